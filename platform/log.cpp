@@ -1,0 +1,19 @@
+#include "platform/log.h"
+
+namespace halvox::platform::detail {
+
+std::string logPrefix(std::string_view unit, std::uint32_t line) {
+  constexpr std::size_t kUnitWidth = 25;
+  constexpr std::size_t kLineWidth = 5;
+  std::string prefix;
+  if (unit.size() < kUnitWidth) prefix.append(kUnitWidth - unit.size(), ' ');
+  prefix += unit;
+  prefix += ':';
+  const std::string number = std::to_string(line);
+  prefix += number;
+  if (number.size() < kLineWidth) prefix.append(kLineWidth - number.size(), ' ');
+  prefix += ' ';
+  return prefix;
+}
+
+}  // namespace halvox::platform::detail

@@ -1,0 +1,410 @@
+#include "platform/value.h"
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+#include <limits>
+
+#include "platform/value_detail.h"
+
+namespace halvox::platform {
+
+using detail::ArrayRep;
+using detail::DataRep;
+using detail::StringRep;
+
+namespace {
+
+// Constants by length, so that a text of a length that no constant has costs one look.
+constexpr std::size_t kMaxConstantLength = 64;
+using ConstantTable = std::array<StringConstant*, kMaxConstantLength + 1>;
+
+ConstantTable& constantTable() {
+  static ConstantTable table{};
+  return table;
+}
+
+// 2^63 and 2^64, exact as doubles.
+constexpr double kTwoTo63 = 9223372036854775808.0;
+constexpr double kTwoTo64 = 18446744073709551616.0;
+
+bool equalIntegers(std::int64_t left, bool leftSigned, std::int64_t right, bool rightSigned) {
+  if (left != right) return false;
+  // The same bits mean the same number unless one side reads them as negative.
+  return leftSigned == rightSigned || left >= 0;
+}
+
+bool equalsDouble(std::int64_t bits, bool isSigned, double number) {
+  if (isSigned) {
+    return number >= -kTwoTo63 && number < kTwoTo63 && number == std::trunc(number) &&
+           static_cast<std::int64_t>(number) == bits;
+  }
+  return number >= 0 && number < kTwoTo64 && number == std::trunc(number) &&
+         static_cast<std::uint64_t>(number) == static_cast<std::uint64_t>(bits);
+}
+
+bool isFloating(NumberKind kind) { return kind >= NumberKind::kFloat; }
+
+bool isSigned(NumberKind kind) {
+  return kind == NumberKind::kInt16 || kind == NumberKind::kInt32 || kind == NumberKind::kInt64;
+}
+
+}  // namespace
+
+StringConstant::StringConstant(std::string_view text) : text_(text) {
+  StringConstant*& head = constantTable().at(text.size());
+  next_ = std::exchange(head, this);
+}
+
+// --- Value --------------------------------------------------------------------------------------
+
+Value::Value(const StringConstant& constant) noexcept {
+  setTag(Tag::kConstantString);
+  setPayload(&constant);
+}
+
+Value::Value(std::string_view text) {
+  if (text.size() <= kMaxConstantLength) {
+    for (const StringConstant* constant = constantTable()[text.size()]; constant != nullptr;
+         constant = constant->next_) {
+      if (constant->text() == text) {
+        setTag(Tag::kConstantString);
+        setPayload(constant);
+        return;
+      }
+    }
+  }
+  if (text.size() <= kInlineCapacity) {
+    setTag(Tag::kInlineString);
+    storage_[1] = static_cast<unsigned char>(text.size());
+    if (!text.empty()) std::memcpy(&storage_[2], text.data(), text.size());
+    return;
+  }
+  void* memory = detail::allocateNode<StringRep>(text.size());
+  auto* rep = new (memory) StringRep{{1}, static_cast<std::uint32_t>(text.size())};
+  std::copy(text.begin(), text.end(), rep->text());
+  setTag(Tag::kSharedString);
+  setPayload(rep);
+}
+
+Value::Value(Date date) noexcept {
+  setTag(Tag::kDate);
+  setPayload(date.secondsSince1970);
+}
+
+Value::Value(Data data) noexcept {
+  setTag(Tag::kData);
+  setPayload(std::exchange(data.rep_, nullptr));
+}
+
+Value::Value(Array array) noexcept {
+  setTag(Tag::kArray);
+  setPayload(std::exchange(array.rep_, nullptr));
+}
+
+Value::Value(Dictionary dictionary) noexcept {
+  setTag(Tag::kDictionary);
+  setPayload(std::exchange(dictionary.rep_, nullptr));
+}
+
+Value::Value(const Value& other) noexcept {
+  std::memcpy(storage_, other.storage_, sizeof storage_);
+  retain();
+}
+
+Value::Value(Value&& other) noexcept {
+  std::memcpy(storage_, other.storage_, sizeof storage_);
+  other.setTag(Tag::kNone);
+}
+
+Value& Value::operator=(const Value& other) noexcept {
+  other.retain();
+  release();
+  std::memmove(storage_, other.storage_, sizeof storage_);
+  return *this;
+}
+
+Value& Value::operator=(Value&& other) noexcept {
+  if (this == &other) return *this;
+  release();
+  std::memcpy(storage_, other.storage_, sizeof storage_);
+  other.setTag(Tag::kNone);
+  return *this;
+}
+
+// Every counted node starts with its reference count, and an empty container has no node.
+void Value::retain() const noexcept {
+  if (!isCounted()) return;
+  if (auto* references = payload<detail::ReferenceCount*>()) detail::retain(*references);
+}
+
+void Value::release() noexcept {
+  if (!isCounted()) return;
+  switch (tag()) {
+    case Tag::kSharedString: {
+      auto* rep = payload<StringRep*>();
+      if (detail::releaseLast(rep->references)) {
+        rep->~StringRep();
+        ::operator delete(rep);
+      }
+      break;
+    }
+    case Tag::kData:
+      detail::releaseData(payload<DataRep*>());
+      break;
+    case Tag::kArray:
+      detail::releaseArray(payload<ArrayRep*>());
+      break;
+    case Tag::kDictionary:
+      detail::releaseDictionary(payload<detail::DictionaryRep*>());
+      break;
+    case Tag::kNone:
+    case Tag::kBool:
+    case Tag::kUInt8:
+    case Tag::kInt16:
+    case Tag::kUInt16:
+    case Tag::kInt32:
+    case Tag::kUInt32:
+    case Tag::kInt64:
+    case Tag::kUInt64:
+    case Tag::kFloat:
+    case Tag::kDouble:
+    case Tag::kDate:
+    case Tag::kInlineString:
+    case Tag::kConstantString:
+      break;
+  }
+  setTag(Tag::kNone);
+}
+
+void Value::setNumber(NumberKind kind, std::int64_t number) noexcept {
+  storage_[0] = static_cast<unsigned char>(static_cast<unsigned>(Tag::kBool) +
+                                           static_cast<unsigned>(kind));
+  setPayload(number);
+}
+
+void Value::setNumber(NumberKind kind, std::uint64_t number) noexcept {
+  setNumber(kind, static_cast<std::int64_t>(number));
+}
+
+void Value::setNumber(NumberKind kind, double number) noexcept {
+  std::int64_t bits = 0;
+  std::memcpy(&bits, &number, sizeof bits);
+  setNumber(kind, bits);
+}
+
+ValueKind Value::kind() const {
+  const Tag current = tag();
+  if (current == Tag::kNone) return ValueKind::kNone;
+  if (current <= Tag::kDouble) return ValueKind::kNumber;
+  if (current == Tag::kDate) return ValueKind::kDate;
+  if (current <= Tag::kSharedString) return ValueKind::kString;
+  if (current == Tag::kData) return ValueKind::kData;
+  return current == Tag::kArray ? ValueKind::kArray : ValueKind::kDictionary;
+}
+
+NumberKind Value::numberKind() const {
+  return static_cast<NumberKind>(storage_[0] - static_cast<unsigned char>(Tag::kBool));
+}
+
+std::int64_t Value::toInt64() const {
+  if (!isNumber()) return 0;
+  const NumberKind kind = numberKind();
+  if (isFloating(kind)) {
+    const auto number = payload<double>();
+    if (std::isnan(number)) return 0;
+    if (number >= kTwoTo63) return std::numeric_limits<std::int64_t>::max();
+    if (number < -kTwoTo63) return std::numeric_limits<std::int64_t>::min();
+    return static_cast<std::int64_t>(number);
+  }
+  const auto bits = payload<std::int64_t>();
+  return bits < 0 && !isSigned(kind) ? std::numeric_limits<std::int64_t>::max() : bits;
+}
+
+std::uint64_t Value::toUInt64() const {
+  if (!isNumber()) return 0;
+  const NumberKind kind = numberKind();
+  if (isFloating(kind)) {
+    const auto number = payload<double>();
+    if (!(number > 0)) return 0;  // a NaN too
+    if (number >= kTwoTo64) return std::numeric_limits<std::uint64_t>::max();
+    return static_cast<std::uint64_t>(number);
+  }
+  const auto bits = payload<std::int64_t>();
+  return bits < 0 && isSigned(kind) ? 0 : static_cast<std::uint64_t>(bits);
+}
+
+double Value::toDouble() const {
+  if (!isNumber()) return 0;
+  const NumberKind kind = numberKind();
+  if (isFloating(kind)) return payload<double>();
+  const auto bits = payload<std::int64_t>();
+  return isSigned(kind) ? static_cast<double>(bits)
+                        : static_cast<double>(static_cast<std::uint64_t>(bits));
+}
+
+bool Value::toBool() const { return toDouble() != 0; }
+
+std::string_view Value::string() const {
+  switch (tag()) {
+    case Tag::kInlineString:
+      return {reinterpret_cast<const char*>(&storage_[2]), storage_[1]};
+    case Tag::kConstantString:
+      return payload<const StringConstant*>()->text();
+    case Tag::kSharedString: {
+      auto* rep = payload<StringRep*>();
+      return {rep->text(), rep->length};
+    }
+    default:  // the many tags that are not strings
+      return {};
+  }
+}
+
+bool Value::isIdenticalTo(const StringConstant& constant) const {
+  return tag() == Tag::kConstantString && payload<const StringConstant*>() == &constant;
+}
+
+Date Value::date() const { return tag() == Tag::kDate ? Date{payload<double>()} : Date{}; }
+
+Data Value::data() const {
+  if (tag() != Tag::kData) return Data(std::span<const std::byte>{});
+  retain();
+  return Data(payload<DataRep*>());
+}
+
+Array Value::array() const {
+  if (tag() != Tag::kArray) return {};
+  retain();
+  return Array(payload<ArrayRep*>());
+}
+
+Dictionary Value::dictionary() const {
+  if (tag() != Tag::kDictionary) return {};
+  retain();
+  return Dictionary(payload<detail::DictionaryRep*>());
+}
+
+std::size_t Value::memorySize() const {
+  switch (tag()) {
+    case Tag::kSharedString:
+      return sizeof(StringRep) + payload<StringRep*>()->length;
+    case Tag::kData: {
+      auto* rep = payload<DataRep*>();
+      return rep == nullptr ? 0 : sizeof(DataRep) + rep->length;
+    }
+    case Tag::kArray:
+      return array().memorySize();
+    case Tag::kDictionary:
+      return dictionary().memorySize();
+    default:  // everything that lives in place
+      return 0;
+  }
+}
+
+bool Value::equalNumbers(const Value& left, const Value& right) {
+  const NumberKind leftKind = left.numberKind();
+  const NumberKind rightKind = right.numberKind();
+  const auto leftBits = left.payload<std::int64_t>();
+  const auto rightBits = right.payload<std::int64_t>();
+  if (isFloating(leftKind) && isFloating(rightKind)) {
+    const auto a = left.payload<double>();
+    const auto b = right.payload<double>();
+    return a == b || (std::isnan(a) && std::isnan(b));
+  }
+  if (isFloating(leftKind)) {
+    return equalsDouble(rightBits, isSigned(rightKind), left.payload<double>());
+  }
+  if (isFloating(rightKind)) {
+    return equalsDouble(leftBits, isSigned(leftKind), right.payload<double>());
+  }
+  return equalIntegers(leftBits, isSigned(leftKind), rightBits, isSigned(rightKind));
+}
+
+bool operator==(const Value& left, const Value& right) {
+  const ValueKind kind = left.kind();
+  if (kind != right.kind()) return false;
+  switch (kind) {
+    case ValueKind::kNone:
+      return true;
+    case ValueKind::kNumber:
+      return Value::equalNumbers(left, right);
+    case ValueKind::kString:
+      return left.string() == right.string();
+    case ValueKind::kDate:
+      return left.date() == right.date();
+    case ValueKind::kData:
+      return left.data() == right.data();
+    case ValueKind::kArray:
+      return left.array() == right.array();
+    case ValueKind::kDictionary:
+      return left.dictionary() == right.dictionary();
+  }
+  return false;
+}
+
+// --- Data ---------------------------------------------------------------------------------------
+
+void detail::releaseData(DataRep* rep) noexcept {
+  if (rep == nullptr || !releaseLast(rep->references)) return;
+  rep->~DataRep();
+  ::operator delete(rep);
+}
+
+Data::Data(std::span<const std::byte> bytes) : rep_(nullptr) {
+  if (bytes.empty()) return;
+  void* memory = detail::allocateNode<DataRep>(bytes.size());
+  rep_ = new (memory) DataRep{{1}, bytes.size()};
+  std::copy(bytes.begin(), bytes.end(), rep_->bytes());
+}
+
+Data::Data(const Data& other) noexcept : rep_(other.rep_) {
+  if (rep_ != nullptr) detail::retain(rep_->references);
+}
+
+Data::~Data() { detail::releaseData(rep_); }
+
+std::span<const std::byte> Data::bytes() const {
+  return rep_ == nullptr ? std::span<const std::byte>{} : std::span(rep_->bytes(), rep_->length);
+}
+
+bool operator==(const Data& left, const Data& right) {
+  return left.rep_ == right.rep_ || std::ranges::equal(left.bytes(), right.bytes());
+}
+
+// --- Array --------------------------------------------------------------------------------------
+
+void detail::releaseArray(ArrayRep* rep) noexcept {
+  if (rep == nullptr || !releaseLast(rep->references)) return;
+  std::destroy_n(rep->values(), rep->count);
+  rep->~ArrayRep();
+  ::operator delete(rep);
+}
+
+Array::Array(std::span<const Value> values) {
+  if (values.empty()) return;
+  void* memory = detail::allocateNode<ArrayRep>(values.size_bytes());
+  rep_ = new (memory) ArrayRep{{1}, static_cast<std::uint32_t>(values.size())};
+  std::uninitialized_copy(values.begin(), values.end(), rep_->values());
+}
+
+Array::Array(const Array& other) noexcept : rep_(other.rep_) {
+  if (rep_ != nullptr) detail::retain(rep_->references);
+}
+
+Array::~Array() { detail::releaseArray(rep_); }
+
+std::size_t Array::size() const { return rep_ == nullptr ? 0 : rep_->count; }
+const Value* Array::begin() const { return rep_ == nullptr ? nullptr : rep_->values(); }
+
+std::size_t Array::memorySize() const {
+  if (rep_ == nullptr) return 0;
+  std::size_t bytes = sizeof(ArrayRep) + rep_->count * sizeof(Value);
+  for (const Value& value : *this) bytes += value.memorySize();
+  return bytes;
+}
+
+bool operator==(const Array& left, const Array& right) {
+  return left.rep_ == right.rep_ || std::ranges::equal(left, right);
+}
+
+}  // namespace halvox::platform

@@ -1,0 +1,353 @@
+#pragma once
+
+#include <atomic>
+#include <concepts>
+#include <cstddef>
+#include <cstdint>
+#include <cstring>
+#include <initializer_list>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <utility>
+
+namespace halvox::platform {
+
+class Array;
+class Dictionary;
+
+// A point in time; `secondsSince1970` counts from 1970-01-01 00:00 UTC.
+struct Date {
+  double secondsSince1970 = 0;
+  friend bool operator==(const Date&, const Date&) = default;
+};
+
+// A program constant whose identity is kept: a value made from a text that equals a constant is
+// that very constant, wherever the text came from, so clients in other processes can name it.
+// Make constants only with static storage and before the first thread starts.
+class StringConstant {
+ public:
+  explicit StringConstant(std::string_view text);
+  StringConstant(const StringConstant&) = delete;
+  StringConstant& operator=(const StringConstant&) = delete;
+
+  [[nodiscard]] std::string_view text() const { return text_; }
+
+ private:
+  friend class Value;
+  std::string_view text_;
+  StringConstant* next_ = nullptr;
+};
+
+namespace detail {
+struct KeyNode;
+struct StringRep;
+struct DataRep;
+struct ArrayRep;
+struct DictionaryRep;
+}  // namespace detail
+
+// The key of a dictionary entry: an immutable text of which equal copies share one node.
+// The table of shared nodes is bounded, so that clients cannot grow it without end; a key that
+// finds no place in it works the same and owns its text. Any thread may make and copy keys.
+class Key {
+ public:
+  Key(std::string_view text);  // NOLINT(google-explicit-constructor): keys are written as texts
+  Key(const char* text) : Key(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
+  Key(const std::string& text) : Key(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
+  Key(const Key& other) noexcept;
+  Key(Key&& other) noexcept : node_(std::exchange(other.node_, nullptr)) {}
+  Key& operator=(Key other) noexcept {
+    std::swap(node_, other.node_);
+    return *this;
+  }
+  ~Key();
+
+  // Valid as long as a copy of this key lives.
+  [[nodiscard]] std::string_view text() const;
+  [[nodiscard]] std::uint32_t hash() const;
+  // True when the text has a blank (U+0020); known without a scan.
+  [[nodiscard]] bool hasBlank() const;
+  // True when all equal keys share this key's node for the life of the process.
+  [[nodiscard]] bool isInterned() const;
+  // Bytes that this key alone keeps alive; 0 for an interned one.
+  [[nodiscard]] std::size_t memorySize() const;
+
+  friend bool operator==(const Key& left, const Key& right);
+
+ private:
+  detail::KeyNode* node_;
+};
+
+// An immutable run of bytes, shared by all its copies.
+class Data {
+ public:
+  explicit Data(std::span<const std::byte> bytes);
+  Data(const Data& other) noexcept;
+  Data(Data&& other) noexcept : rep_(std::exchange(other.rep_, nullptr)) {}
+  Data& operator=(Data other) noexcept {
+    std::swap(rep_, other.rep_);
+    return *this;
+  }
+  ~Data();
+
+  // Valid as long as a copy of this object lives.
+  [[nodiscard]] std::span<const std::byte> bytes() const;
+
+  friend bool operator==(const Data& left, const Data& right);
+
+ private:
+  friend class Value;
+  explicit Data(detail::DataRep* rep) : rep_(rep) {}
+  detail::DataRep* rep_;
+};
+
+// What a number was when it was made. Comparison ignores it; encoders use it.
+enum class NumberKind : std::uint8_t {
+  kBool,
+  kUInt8,
+  kInt16,
+  kUInt16,
+  kInt32,
+  kUInt32,
+  kInt64,
+  kUInt64,
+  kFloat,
+  kDouble,
+};
+
+enum class ValueKind : std::uint8_t { kNone, kNumber, kString, kDate, kData, kArray, kDictionary };
+
+// One property-list value: a number, a string, a date, data, an array or a dictionary.
+//
+// Values are immutable and shared: copying costs at most one reference count, and short strings and
+// numbers live in the value itself. Distinct copies may be used by different threads at once; one
+// value object belongs to one thread at a time, like any other plain object.
+//
+// Two values are equal when their contents are: numbers by value whatever their kind (1, 1.0 and
+// true are equal; a NaN equals every NaN, so that equal means interchangeable), strings and data
+// byte for byte, arrays element by element, dictionaries entry by entry in any order.
+//
+// Strings are UTF-8; whoever makes a value from outside bytes checks that first.
+class Value {
+ public:
+  Value() noexcept = default;  // no value at all; equal only to another such
+  template <typename Number>
+    requires std::integral<Number> || std::floating_point<Number>
+  Value(Number number) noexcept;            // NOLINT(google-explicit-constructor): plain data
+  Value(std::string_view text);             // NOLINT(google-explicit-constructor)
+  Value(const char* text) : Value(std::string_view(text)) {}         // NOLINT(google-explicit-constructor)
+  Value(const std::string& text) : Value(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
+  Value(const StringConstant& constant) noexcept;                    // NOLINT(google-explicit-constructor)
+  Value(Date date) noexcept;                // NOLINT(google-explicit-constructor)
+  Value(Data data) noexcept;                // NOLINT(google-explicit-constructor)
+  Value(Array array) noexcept;              // NOLINT(google-explicit-constructor)
+  Value(Dictionary dictionary) noexcept;    // NOLINT(google-explicit-constructor)
+  Value(const Value& other) noexcept;
+  Value(Value&& other) noexcept;
+  Value& operator=(const Value& other) noexcept;
+  Value& operator=(Value&& other) noexcept;
+  ~Value() { release(); }
+
+  [[nodiscard]] ValueKind kind() const;
+  [[nodiscard]] bool isNumber() const { return kind() == ValueKind::kNumber; }
+  [[nodiscard]] bool isString() const { return kind() == ValueKind::kString; }
+  [[nodiscard]] bool isArray() const { return kind() == ValueKind::kArray; }
+  [[nodiscard]] bool isDictionary() const { return kind() == ValueKind::kDictionary; }
+
+  // The kind of a number; only for numbers.
+  [[nodiscard]] NumberKind numberKind() const;
+  // A number read as the type asked for: fractions are cut off, what lies outside the type's range
+  // becomes its nearest end, a NaN becomes 0. Anything but a number gives 0.
+  [[nodiscard]] std::int64_t toInt64() const;
+  [[nodiscard]] std::uint64_t toUInt64() const;
+  [[nodiscard]] double toDouble() const;
+  [[nodiscard]] bool toBool() const;
+
+  // The text of a string, empty for anything else. Points into this value: it is valid until this
+  // value is changed, moved from or destroyed.
+  [[nodiscard]] std::string_view string() const;
+  // True when this string is that very constant (see StringConstant).
+  [[nodiscard]] bool isIdenticalTo(const StringConstant& constant) const;
+
+  // The content, or an empty one when the value is of another kind.
+  [[nodiscard]] Date date() const;
+  [[nodiscard]] Data data() const;
+  [[nodiscard]] Array array() const;
+  [[nodiscard]] Dictionary dictionary() const;
+
+  // Bytes on the heap that this value keeps alive, shared ones included, the value's own 16 not.
+  [[nodiscard]] std::size_t memorySize() const;
+
+  friend bool operator==(const Value& left, const Value& right);
+
+ private:
+  enum class Tag : std::uint8_t {
+    kNone,
+    // Numbers, in the order of NumberKind.
+    kBool,
+    kUInt8,
+    kInt16,
+    kUInt16,
+    kInt32,
+    kUInt32,
+    kInt64,
+    kUInt64,
+    kFloat,
+    kDouble,
+    kDate,
+    kInlineString,
+    kConstantString,
+    // From here on the payload is a counted reference.
+    kSharedString,
+    kData,
+    kArray,
+    kDictionary,
+  };
+  static constexpr std::size_t kInlineCapacity = 14;
+
+  [[nodiscard]] Tag tag() const { return static_cast<Tag>(storage_[0]); }
+  [[nodiscard]] bool isCounted() const { return tag() >= Tag::kSharedString; }
+  void setTag(Tag tag) { storage_[0] = static_cast<unsigned char>(tag); }
+  template <typename T>
+  void setPayload(T payload) {
+    static_assert(sizeof(T) == 8);
+    std::memcpy(&storage_[8], &payload, sizeof payload);
+  }
+  template <typename T>
+  [[nodiscard]] T payload() const {
+    static_assert(sizeof(T) == 8);
+    T result;
+    std::memcpy(&result, &storage_[8], sizeof result);
+    return result;
+  }
+  void retain() const noexcept;
+  void release() noexcept;
+  void setNumber(NumberKind kind, std::int64_t number) noexcept;
+  void setNumber(NumberKind kind, std::uint64_t number) noexcept;
+  void setNumber(NumberKind kind, double number) noexcept;
+  static bool equalNumbers(const Value& left, const Value& right);
+
+  // Byte 0 is the tag; a number, date or reference is in bytes 8 to 15; an inline string has its
+  // length in byte 1 and its text from byte 2 on.
+  alignas(8) unsigned char storage_[16] = {};
+};
+
+// An immutable list of values, shared by all its copies.
+class Array {
+ public:
+  Array() noexcept = default;
+  Array(std::initializer_list<Value> values) : Array(std::span(values.begin(), values.size())) {}
+  explicit Array(std::span<const Value> values);
+  Array(const Array& other) noexcept;
+  Array(Array&& other) noexcept : rep_(std::exchange(other.rep_, nullptr)) {}
+  Array& operator=(Array other) noexcept {
+    std::swap(rep_, other.rep_);
+    return *this;
+  }
+  ~Array();
+
+  [[nodiscard]] std::size_t size() const;
+  [[nodiscard]] bool empty() const { return size() == 0; }
+  [[nodiscard]] const Value* begin() const;
+  [[nodiscard]] const Value* end() const { return begin() + size(); }
+  [[nodiscard]] const Value& operator[](std::size_t index) const { return begin()[index]; }
+  [[nodiscard]] std::size_t memorySize() const;
+
+  friend bool operator==(const Array& left, const Array& right);
+
+ private:
+  friend class Value;
+  explicit Array(detail::ArrayRep* rep) : rep_(rep) {}
+  detail::ArrayRep* rep_ = nullptr;
+};
+
+// A dictionary from texts to values. Copies share their content until one of them is changed: the
+// change copies it first, so nobody sees another's change. Entries are enumerated in the order in
+// which their keys were first set. Finding is by identity of the interned key for a small
+// dictionary and by an index for a large one, so hostile sizes cost no more than their bytes.
+class Dictionary {
+ public:
+  struct Entry {
+    Key key;
+    Value value;
+  };
+
+  Dictionary() noexcept = default;
+  Dictionary(std::initializer_list<Entry> entries);
+  Dictionary(const Dictionary& other) noexcept;
+  Dictionary(Dictionary&& other) noexcept : rep_(std::exchange(other.rep_, nullptr)) {}
+  Dictionary& operator=(Dictionary other) noexcept {
+    std::swap(rep_, other.rep_);
+    return *this;
+  }
+  ~Dictionary();
+
+  [[nodiscard]] std::size_t size() const;
+  [[nodiscard]] bool empty() const { return size() == 0; }
+  [[nodiscard]] const Entry* begin() const;
+  [[nodiscard]] const Entry* end() const { return begin() + size(); }
+
+  // The value under a key, or null. Points into this dictionary: valid until it is changed.
+  [[nodiscard]] const Value* find(const Key& key) const;
+  [[nodiscard]] const Value* find(std::string_view key) const;
+  [[nodiscard]] const Value* find(const char* key) const { return find(std::string_view(key)); }
+  [[nodiscard]] bool contains(std::string_view key) const { return find(key) != nullptr; }
+
+  // Makes room for that many entries in all, so that setting them allocates no more.
+  void reserve(std::size_t entries);
+  // Sets the value under a key, in the place of an old one or at the end.
+  void set(const Key& key, Value value);
+  // Removes the entry under a key; false when there was none.
+  bool remove(const Key& key);
+  // Sets every entry of `other`, in its order.
+  void merge(const Dictionary& other);
+
+  [[nodiscard]] bool isIdenticalTo(const Dictionary& other) const { return rep_ == other.rep_; }
+  // Bytes on the heap that this dictionary keeps alive, shared ones included.
+  [[nodiscard]] std::size_t memorySize() const;
+
+  friend bool operator==(const Dictionary& left, const Dictionary& right);
+
+ private:
+  friend class Value;
+  explicit Dictionary(detail::DictionaryRep* rep) : rep_(rep) {}
+  void makeRoomFor(std::size_t entries);
+  detail::DictionaryRep* rep_ = nullptr;
+};
+
+// A message as the components hand it on: there may be none at all.
+using Message = std::optional<Dictionary>;
+
+// The text of a value as log lines show it: strings as they stand, numbers in their shortest
+// decimal form, containers in braces or parentheses with their parts, data as hexadecimal digits,
+// dates as UTC. "(null)" for no value.
+std::string describe(const Value& value);
+std::string describe(const Dictionary& dictionary);
+std::string describe(const Message& message);
+
+template <typename Number>
+  requires std::integral<Number> || std::floating_point<Number>
+Value::Value(Number number) noexcept {
+  if constexpr (std::same_as<Number, bool>) {
+    setNumber(NumberKind::kBool, static_cast<std::uint64_t>(number));
+  } else if constexpr (std::same_as<Number, float>) {
+    setNumber(NumberKind::kFloat, static_cast<double>(number));
+  } else if constexpr (std::floating_point<Number>) {
+    setNumber(NumberKind::kDouble, static_cast<double>(number));
+  } else if constexpr (std::signed_integral<Number>) {
+    constexpr auto kKind = sizeof(Number) <= 2   ? NumberKind::kInt16
+                           : sizeof(Number) == 4 ? NumberKind::kInt32
+                                                 : NumberKind::kInt64;
+    setNumber(kKind, static_cast<std::int64_t>(number));
+  } else {
+    constexpr auto kKind = sizeof(Number) == 1   ? NumberKind::kUInt8
+                           : sizeof(Number) == 2 ? NumberKind::kUInt16
+                           : sizeof(Number) == 4 ? NumberKind::kUInt32
+                                                 : NumberKind::kUInt64;
+    setNumber(kKind, static_cast<std::uint64_t>(number));
+  }
+}
+
+}  // namespace halvox::platform

@@ -1,0 +1,198 @@
+#include <algorithm>
+#include <cassert>
+#include <functional>
+
+#include "platform/value_detail.h"
+
+namespace halvox::platform {
+
+using detail::DictionaryRep;
+
+namespace {
+
+// Up to this many entries a walk over the keys is faster than an index.
+constexpr std::uint32_t kMaxWithoutIndex = 16;
+constexpr std::uint32_t kFirstCapacity = 4;
+
+DictionaryRep* allocateRep(std::size_t capacity) {
+  void* memory = detail::allocateNode<DictionaryRep>(capacity * sizeof(Dictionary::Entry));
+  return new (memory) DictionaryRep{{1}, 0, static_cast<std::uint32_t>(capacity), 0, nullptr};
+}
+
+void addToIndex(DictionaryRep& rep, std::uint32_t entry) {
+  const std::uint32_t mask = rep.indexSize - 1;
+  std::uint32_t slot = rep.entries()[entry].key.hash() & mask;
+  while (rep.index[slot] != 0) slot = (slot + 1) & mask;
+  rep.index[slot] = entry + 1;
+}
+
+void buildIndex(DictionaryRep& rep) {
+  delete[] rep.index;
+  rep.index = nullptr;
+  rep.indexSize = 0;
+  if (rep.count <= kMaxWithoutIndex) return;
+  rep.indexSize = 64;
+  while (rep.indexSize < 2 * rep.count) rep.indexSize *= 2;
+  rep.index = new std::uint32_t[rep.indexSize]();
+  for (std::uint32_t entry = 0; entry < rep.count; ++entry) addToIndex(rep, entry);
+}
+
+void noteAppended(DictionaryRep& rep) {
+  if (rep.indexSize >= 2 * rep.count) {
+    addToIndex(rep, rep.count - 1);
+  } else if (rep.count > kMaxWithoutIndex) {
+    buildIndex(rep);
+  }
+}
+
+template <typename Matches>
+Dictionary::Entry* findEntry(DictionaryRep* rep, std::uint32_t hash, const Matches& matches) {
+  if (rep == nullptr) return nullptr;
+  Dictionary::Entry* entries = rep->entries();
+  if (rep->indexSize == 0) {
+    Dictionary::Entry* const end = entries + rep->count;
+    Dictionary::Entry* const found = std::find_if(entries, end, matches);
+    return found == end ? nullptr : found;
+  }
+  const std::uint32_t mask = rep->indexSize - 1;
+  for (std::uint32_t slot = hash & mask; rep->index[slot] != 0; slot = (slot + 1) & mask) {
+    Dictionary::Entry& entry = entries[rep->index[slot] - 1];
+    if (entry.key.hash() == hash && matches(entry)) return &entry;
+  }
+  return nullptr;
+}
+
+Dictionary::Entry* findEntry(DictionaryRep* rep, const Key& key) {
+  return findEntry(rep, key.hash(),
+                   [&key](const Dictionary::Entry& entry) { return entry.key == key; });
+}
+
+}  // namespace
+
+void detail::releaseDictionary(DictionaryRep* rep) noexcept {
+  if (rep == nullptr || !releaseLast(rep->references)) return;
+  std::destroy_n(rep->entries(), rep->count);
+  delete[] rep->index;
+  rep->~DictionaryRep();
+  ::operator delete(rep);
+}
+
+Dictionary::Dictionary(std::initializer_list<Entry> entries) {
+  reserve(entries.size());
+  for (const Entry& entry : entries) set(entry.key, entry.value);
+}
+
+Dictionary::Dictionary(const Dictionary& other) noexcept : rep_(other.rep_) {
+  if (rep_ != nullptr) detail::retain(rep_->references);
+}
+
+Dictionary::~Dictionary() { detail::releaseDictionary(rep_); }
+
+std::size_t Dictionary::size() const { return rep_ == nullptr ? 0 : rep_->count; }
+
+const Dictionary::Entry* Dictionary::begin() const {
+  return rep_ == nullptr ? nullptr : rep_->entries();
+}
+
+const Value* Dictionary::find(const Key& key) const {
+  const Entry* entry = findEntry(rep_, key);
+  return entry == nullptr ? nullptr : &entry->value;
+}
+
+const Value* Dictionary::find(std::string_view key) const {
+  if (rep_ == nullptr) return nullptr;
+  const auto hash = rep_->indexSize == 0
+                        ? 0
+                        : static_cast<std::uint32_t>(std::hash<std::string_view>{}(key));
+  const Entry* entry = findEntry(
+      rep_, hash, [key](const Entry& candidate) { return candidate.key.text() == key; });
+  return entry == nullptr ? nullptr : &entry->value;
+}
+
+// Afterwards this dictionary alone holds its content and has a place for one more entry at least
+// when `entries` is more than it has.
+void Dictionary::makeRoomFor(std::size_t entries) {
+  if (rep_ == nullptr) {
+    rep_ = allocateRep(std::max<std::size_t>(entries, kFirstCapacity));
+    return;
+  }
+  const bool alone = rep_->references.load(std::memory_order_acquire) == 1;
+  if (alone && entries <= rep_->capacity) return;
+  // A copy that is changed once and then kept, as most are, gets just the room it needs.
+  const std::size_t capacity =
+      alone ? std::max<std::size_t>(entries, rep_->capacity + rep_->capacity / 2) : entries;
+  DictionaryRep* grown = allocateRep(capacity);
+  if (alone) {
+    std::uninitialized_move_n(rep_->entries(), rep_->count, grown->entries());
+    std::swap(grown->index, rep_->index);
+    std::swap(grown->indexSize, rep_->indexSize);
+    grown->count = rep_->count;
+  } else {
+    std::uninitialized_copy_n(rep_->entries(), rep_->count, grown->entries());
+    grown->count = rep_->count;
+    buildIndex(*grown);
+  }
+  detail::releaseDictionary(std::exchange(rep_, grown));
+}
+
+void Dictionary::reserve(std::size_t entries) {
+  if (entries > 0) makeRoomFor(std::max(entries, size()));
+}
+
+void Dictionary::set(const Key& key, Value value) {
+  if (const Entry* existing = findEntry(rep_, key)) {
+    const auto position = existing - rep_->entries();
+    makeRoomFor(rep_->count);
+    rep_->entries()[position].value = std::move(value);
+    return;
+  }
+  makeRoomFor(size() + 1);
+  new (rep_->entries() + rep_->count) Entry{key, std::move(value)};
+  ++rep_->count;
+  noteAppended(*rep_);
+}
+
+bool Dictionary::remove(const Key& key) {
+  const Entry* existing = findEntry(rep_, key);
+  if (existing == nullptr) return false;
+  const auto position = existing - rep_->entries();
+  makeRoomFor(rep_->count);
+  Entry* entries = rep_->entries();
+  std::move(entries + position + 1, entries + rep_->count, entries + position);
+  std::destroy_at(entries + rep_->count - 1);
+  --rep_->count;
+  buildIndex(*rep_);
+  return true;
+}
+
+void Dictionary::merge(const Dictionary& other) {
+  if (rep_ == nullptr) {
+    *this = other;
+    return;
+  }
+  const Dictionary source = other;  // keeps the entries where they are if `other` is this one
+  for (const Entry& entry : source) set(entry.key, entry.value);
+}
+
+std::size_t Dictionary::memorySize() const {
+  if (rep_ == nullptr) return 0;
+  std::size_t bytes = sizeof(DictionaryRep) + rep_->capacity * sizeof(Entry) +
+                      rep_->indexSize * sizeof(std::uint32_t);
+  for (const Entry& entry : *this) bytes += entry.key.memorySize() + entry.value.memorySize();
+  return bytes;
+}
+
+bool operator==(const Dictionary& left, const Dictionary& right) {
+  if (left.rep_ == right.rep_) return true;
+  if (left.size() != right.size()) return false;
+  // Repeated messages have their keys in the same order, so the same place is tried first.
+  const Dictionary::Entry* other = right.begin();
+  for (const Dictionary::Entry& entry : left) {
+    const Value* counterpart = other->key == entry.key ? &other->value : right.find(entry.key);
+    if (counterpart == nullptr || !(*counterpart == entry.value)) return false;
+    ++other;
+  }
+  return true;
+}
+
+}  // namespace halvox::platform
