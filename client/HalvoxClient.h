@@ -24,10 +24,11 @@ using ServiceType = std::uint16_t;
 // Why a request got no answer of its own.
 struct Failure {
   enum class Kind : std::uint8_t {
-    kNoService,   // nobody serves the socket, or the connection ended before the answer
-    kRefused,     // the service answered with an error
+    kNoService,  // nobody serves the socket, or the connection ended before the answer
+    kRefused,    // the service answered with an error
     kTimedOut,
-    kBadRequest,  // the request could not be put on the wire (a value it has no form for, too large)
+    kBadRequest,  // the request could not be put on the wire (a value it has no form for, too
+                  // large)
   };
   Kind kind = Kind::kNoService;
   std::string name;     // the D-Bus error name, when the service gave one
@@ -61,8 +62,8 @@ struct Counters {
   std::uint64_t dropped = 0;       // not taken: the hand-off was full or the client was closing
   std::uint64_t acknowledged = 0;  // answered by the service
   std::uint64_t refused = 0;       // answered with an error
-  std::uint64_t lost = 0;          // in flight when a connection ended: the service may have had them
-  std::uint64_t pending = 0;       // waiting or in flight
+  std::uint64_t lost = 0;     // in flight when a connection ended: the service may have had them
+  std::uint64_t pending = 0;  // waiting or in flight
   std::uint64_t reconnects = 0;
 };
 

@@ -43,15 +43,15 @@ class ExportedObject {
   [[nodiscard]] virtual ResourceUse resourceUse() const { return {}; }
 };
 
-// Held by the job that carries a request out; when it goes, the request counts as carried out. The
-// connection reads on only while few are open, so a client cannot pile up work.
+// Held by the job that carries a request out; when the last copy goes, the request counts as
+// carried out, answered or not. A connection is read from only while few of its requests are open,
+// so a client cannot pile up work.
 using RequestToken = std::shared_ptr<void>;
 
 // One request as it came from the wire, decoded and of the method's signature.
 struct Invocation {
   std::span<const Value> arguments;
-  ReplyCallback reply;  // empty when the client wants no answer
-  RequestToken token;
+  ReplyCallback reply;  // never empty; does nothing when the client wants no answer
 };
 
 // Whether a request can make the service hold more; such requests are refused while the client is
@@ -125,6 +125,9 @@ class ConnectionService {
   virtual NSXPCListener& serviceListener() = 0;
   // The connection whose request or handler is running on this thread, or null.
   [[nodiscard]] virtual const NSXPCConnection* currentConnection() const = 0;
+  // The request that is being delivered on this thread, or null. Whoever queues its work keeps the
+  // token in the job.
+  [[nodiscard]] virtual RequestToken currentRequest() const = 0;
 };
 
 }  // namespace halvox::platform

@@ -63,12 +63,10 @@ inline void appendLogPart(std::string& line, const Dictionary& value) { line += 
 inline void appendLogPart(std::string& line, const Message& value) { line += describe(value); }
 // Anything that can say what it is; asked only when the line is written.
 template <typename Described>
-  requires requires(const Described& part) {
-    { part.description() } -> std::convertible_to<std::string>;
-  }
-void appendLogPart(std::string& line, const Described& part) {
-  line += part.description();
+requires requires(const Described& part) {
+  { part.description() } -> std::convertible_to<std::string>;
 }
+void appendLogPart(std::string& line, const Described& part) { line += part.description(); }
 
 // The name right-aligned in 25 characters, a colon, the line left-aligned in 5, a blank.
 std::string logPrefix(std::string_view unit, std::uint32_t line);

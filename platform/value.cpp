@@ -178,8 +178,8 @@ void Value::release() noexcept {
 }
 
 void Value::setNumber(NumberKind kind, std::int64_t number) noexcept {
-  storage_[0] = static_cast<unsigned char>(static_cast<unsigned>(Tag::kBool) +
-                                           static_cast<unsigned>(kind));
+  storage_[0] =
+      static_cast<unsigned char>(static_cast<unsigned>(Tag::kBool) + static_cast<unsigned>(kind));
   setPayload(number);
 }
 

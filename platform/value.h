@@ -55,7 +55,8 @@ class Key {
  public:
   Key(std::string_view text);  // NOLINT(google-explicit-constructor): keys are written as texts
   Key(const char* text) : Key(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
-  Key(const std::string& text) : Key(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
+  Key(const std::string& text)
+      : Key(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
   Key(const Key& other) noexcept;
   Key(Key&& other) noexcept : node_(std::exchange(other.node_, nullptr)) {}
   Key& operator=(Key other) noexcept {
@@ -134,16 +135,17 @@ class Value {
  public:
   Value() noexcept = default;  // no value at all; equal only to another such
   template <typename Number>
-    requires std::integral<Number> || std::floating_point<Number>
-  Value(Number number) noexcept;            // NOLINT(google-explicit-constructor): plain data
-  Value(std::string_view text);             // NOLINT(google-explicit-constructor)
-  Value(const char* text) : Value(std::string_view(text)) {}         // NOLINT(google-explicit-constructor)
-  Value(const std::string& text) : Value(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
-  Value(const StringConstant& constant) noexcept;                    // NOLINT(google-explicit-constructor)
-  Value(Date date) noexcept;                // NOLINT(google-explicit-constructor)
-  Value(Data data) noexcept;                // NOLINT(google-explicit-constructor)
-  Value(Array array) noexcept;              // NOLINT(google-explicit-constructor)
-  Value(Dictionary dictionary) noexcept;    // NOLINT(google-explicit-constructor)
+  requires std::integral<Number> || std::floating_point<Number> Value(Number number)
+  noexcept;                      // NOLINT(google-explicit-constructor): plain data
+  Value(std::string_view text);  // NOLINT(google-explicit-constructor)
+  Value(const char* text) : Value(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
+  Value(const std::string& text)
+      : Value(std::string_view(text)) {}           // NOLINT(google-explicit-constructor)
+  Value(const StringConstant& constant) noexcept;  // NOLINT(google-explicit-constructor)
+  Value(Date date) noexcept;                       // NOLINT(google-explicit-constructor)
+  Value(Data data) noexcept;                       // NOLINT(google-explicit-constructor)
+  Value(Array array) noexcept;                     // NOLINT(google-explicit-constructor)
+  Value(Dictionary dictionary) noexcept;           // NOLINT(google-explicit-constructor)
   Value(const Value& other) noexcept;
   Value(Value&& other) noexcept;
   Value& operator=(const Value& other) noexcept;
@@ -328,8 +330,8 @@ std::string describe(const Dictionary& dictionary);
 std::string describe(const Message& message);
 
 template <typename Number>
-  requires std::integral<Number> || std::floating_point<Number>
-Value::Value(Number number) noexcept {
+requires std::integral<Number> || std::floating_point<Number> Value::Value(Number number)
+noexcept {
   if constexpr (std::same_as<Number, bool>) {
     setNumber(NumberKind::kBool, static_cast<std::uint64_t>(number));
   } else if constexpr (std::same_as<Number, float>) {

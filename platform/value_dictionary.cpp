@@ -101,11 +101,10 @@ const Value* Dictionary::find(const Key& key) const {
 
 const Value* Dictionary::find(std::string_view key) const {
   if (rep_ == nullptr) return nullptr;
-  const auto hash = rep_->indexSize == 0
-                        ? 0
-                        : static_cast<std::uint32_t>(std::hash<std::string_view>{}(key));
-  const Entry* entry = findEntry(
-      rep_, hash, [key](const Entry& candidate) { return candidate.key.text() == key; });
+  const auto hash =
+      rep_->indexSize == 0 ? 0 : static_cast<std::uint32_t>(std::hash<std::string_view>{}(key));
+  const Entry* entry =
+      findEntry(rep_, hash, [key](const Entry& candidate) { return candidate.key.text() == key; });
   return entry == nullptr ? nullptr : &entry->value;
 }
 

@@ -21,8 +21,8 @@ constexpr std::size_t kMaxProbes = 16;
 KeyNode* makeNode(std::string_view text, std::uint32_t hash, bool interned) {
   void* memory = detail::allocateNode<KeyNode>(text.size());
   const bool blank = text.find(' ') != std::string_view::npos;
-  auto* node = new (memory)
-      KeyNode{{1}, hash, static_cast<std::uint32_t>(text.size()), interned, blank};
+  auto* node =
+      new (memory) KeyNode{{1}, hash, static_cast<std::uint32_t>(text.size()), interned, blank};
   std::copy(text.begin(), text.end(), node->text());
   return node;
 }

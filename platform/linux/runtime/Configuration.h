@@ -23,7 +23,7 @@ struct Configuration {
     std::filesystem::path socket;
     BusKind bus = BusKind::kNone;
     std::chrono::milliseconds handshakeTimeout{30'000};  // handshake_seconds
-    std::chrono::milliseconds messageTimeout{60'000};    // message_seconds: a message begun must end
+    std::chrono::milliseconds messageTimeout{60'000};  // message_seconds: a message begun must end
   };
   struct Storage {
     std::filesystem::path directory;
@@ -44,12 +44,12 @@ struct Configuration {
   Analytics analytics;
   Limits limits;
   LogLevel logLevel = LogLevel::kDefault;
-  Dictionary device;                                         // [device]: property to value
+  Dictionary device;                                            // [device]: property to value
   std::map<std::string, std::map<std::string, bool>> features;  // [features.Domain]: name to switch
 };
 
-// Why a configuration was not taken. `description` is one line for the user: file, line, column, the
-// key and what was expected of it.
+// Why a configuration was not taken. `description` is one line for the user: file, line, column,
+// the key and what was expected of it.
 struct ConfigurationError {
   std::string description;
 };
