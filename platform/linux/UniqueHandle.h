@@ -1,0 +1,49 @@
+#pragma once
+
+#include <utility>
+
+#include <unistd.h>
+
+namespace halvox::platform::linux_ {
+
+// Owns one handle of a C library and gives it back with `kRelease`, whose result is ignored.
+// Move-only; an empty one holds `kNone` and gives nothing back.
+//
+//   using Bus = UniqueHandle<sd_bus*, sd_bus_flush_close_unref>;
+//   Bus bus;
+//   if (const int result = sd_bus_new(bus.out()); result < 0) ...
+template <typename Raw, auto kRelease, Raw kNone = Raw{}>
+class UniqueHandle {
+ public:
+  constexpr UniqueHandle() noexcept = default;
+  constexpr explicit UniqueHandle(Raw raw) noexcept : raw_(raw) {}
+  UniqueHandle(UniqueHandle&& other) noexcept : raw_(other.release()) {}
+  UniqueHandle& operator=(UniqueHandle&& other) noexcept {
+    reset(other.release());
+    return *this;
+  }
+  ~UniqueHandle() { reset(); }
+
+  [[nodiscard]] Raw get() const noexcept { return raw_; }
+  explicit operator bool() const noexcept { return raw_ != kNone; }
+
+  // Gives the handle up without releasing it.
+  [[nodiscard]] Raw release() noexcept { return std::exchange(raw_, kNone); }
+  // Releases what is held and takes `raw` instead.
+  void reset(Raw raw = kNone) noexcept {
+    const Raw old = std::exchange(raw_, raw);
+    if (old != kNone && old != raw) static_cast<void>(kRelease(old));
+  }
+  // Where a C function stores a new handle; what was held is released first.
+  [[nodiscard]] Raw* out() noexcept {
+    reset();
+    return &raw_;
+  }
+
+ private:
+  Raw raw_ = kNone;
+};
+
+using UniqueFd = UniqueHandle<int, ::close, -1>;
+
+}  // namespace halvox::platform::linux_
