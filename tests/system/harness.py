@@ -1,0 +1,345 @@
+"""Runs the built service in a scratch directory and talks to it with clients that are not ours.
+
+Everything that is started here is stopped here, by process id. Waiting is always for a named
+condition with a deadline.
+"""
+
+import contextlib
+import itertools
+import json
+import os
+import select
+import shutil
+import signal
+import socket
+import sqlite3
+import subprocess
+import tempfile
+import time
+import unittest
+from pathlib import Path
+
+import gi
+
+gi.require_version("Gio", "2.0")
+from gi.repository import Gio, GLib  # noqa: E402
+
+BIN = Path(os.environ.get("HALVOX_BIN", "build/dev/bin")).resolve()
+SERVICE = BIN / "halvox-reportingd"
+CTL = BIN / "halvoxctl"
+BUS_NAME = "com.tarno.halvox.reporting"
+OBJECT = "/com/tarno/halvox/reporting"
+INTERFACE = "com.tarno.halvox.HVReportingServiceProtocol"
+DEADLINE = 30.0  # seconds; generous, for sanitizer builds on a busy machine
+
+PLAYBACK = 4
+START, STOP = 1, 2
+
+
+def wait_for(what, condition, deadline=DEADLINE, pause=0.01):
+    """Waits until condition() is true and returns its value; fails naming what was awaited."""
+    end = time.monotonic() + deadline
+    while True:
+        value = condition()
+        if value:
+            return value
+        if time.monotonic() > end:
+            raise AssertionError(f"waited {deadline:.0f} s in vain for {what}")
+        time.sleep(pause)
+
+
+def stop_process(process, signal_number=signal.SIGTERM, deadline=DEADLINE):
+    """Stops one of our own processes by its id and returns its exit status."""
+    if process.poll() is None:
+        process.send_signal(signal_number)
+        try:
+            process.wait(deadline)
+        except subprocess.TimeoutExpired:
+            process.kill()
+            process.wait(deadline)
+            raise AssertionError(f"{process.args[0]} did not end within {deadline:.0f} s")
+    return process.returncode
+
+
+class NotifySocket:
+    """Where the service says READY=1, as it does for systemd."""
+
+    def __init__(self, directory):
+        self.path = str(Path(directory) / "notify")
+        with contextlib.suppress(FileNotFoundError):
+            os.unlink(self.path)
+        self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
+        self._socket.bind(self.path)
+
+    def wait_ready(self, process, log_path, deadline=DEADLINE):
+        end = time.monotonic() + deadline
+        while time.monotonic() < end:
+            readable, _, _ = select.select([self._socket], [], [], 0.05)
+            if readable and b"READY=1" in self._socket.recv(4096):
+                return
+            if process.poll() is not None:
+                text = Path(log_path).read_text(errors="replace")
+                raise AssertionError(f"service ended with {process.returncode}:\n{text}")
+        raise AssertionError("service did not become ready:\n" + Path(log_path).read_text(errors="replace"))
+
+    def close(self):
+        self._socket.close()
+
+
+class Service:
+    """The built service with its own directories. Use as a context manager or call stop()."""
+
+    def __init__(self, config="", bus="none", environment=None, directory=None, command=None):
+        self.directory = Path(directory or tempfile.mkdtemp(prefix="halvox-test-"))
+        self._owns_directory = directory is None
+        self.socket = self.directory / "reporting.sock"
+        self.database = self.directory / "state" / "halvox.db"
+        self.config = self.directory / "halvox.toml"
+        self.log_path = self.directory / "service.log"
+        # Tests add tables of their own; the two that every test needs are put together here.
+        self.config.write_text(
+            f'[listener]\nsocket = "{self.socket}"\nbus = "{bus}"\n'
+            + ("" if "[storage]" in config else f'[storage]\ndirectory = "{self.directory / "state"}"\n')
+            + config
+        )
+        self._environment = {
+            **os.environ,
+            "HALVOX_CONFIG": str(self.config),
+            "XDG_RUNTIME_DIR": str(self.directory),
+            "XDG_STATE_HOME": str(self.directory / "xdg-state"),
+            **(environment or {}),
+        }
+        self._command = command or [str(SERVICE)]
+        self.process = None
+
+    def start(self, wait=True):
+        notify = NotifySocket(self.directory)
+        try:
+            with open(self.log_path, "ab") as log:
+                self.process = subprocess.Popen(
+                    self._command,
+                    env={**self._environment, "NOTIFY_SOCKET": notify.path},
+                    stdin=subprocess.DEVNULL, stdout=log, stderr=log,
+                )
+            if wait:
+                notify.wait_ready(self.process, self.log_path)
+        except BaseException:
+            if self.process is not None and self.process.poll() is None:
+                self.process.kill()
+                self.process.wait()
+            raise
+        finally:
+            notify.close()
+        return self
+
+    def stop(self, signal_number=signal.SIGTERM):
+        status = stop_process(self.process, signal_number) if self.process else None
+        return status
+
+    def __enter__(self):
+        return self.start()
+
+    def __exit__(self, *_):
+        try:
+            self.stop()
+        finally:
+            if self._owns_directory:
+                shutil.rmtree(self.directory, ignore_errors=True)
+
+    @property
+    def address(self):
+        return f"unix:path={self.socket}"
+
+    def log(self):
+        return self.log_path.read_text(errors="replace")
+
+    def client(self):
+        return Client.to_socket(self.address)
+
+    def events(self):
+        """All recorded events in order, as (name, payload) pairs; none before the first commit."""
+        if not self.database.exists():
+            return []
+        with contextlib.closing(sqlite3.connect(f"file:{self.database}?mode=ro", uri=True)) as database:
+            rows = database.execute("SELECT name, payload FROM analytics_events").fetchall()
+        return [(name, json.loads(payload)) for name, payload in rows]
+
+    def wait_for_events(self, count):
+        return wait_for(f"{count} events", lambda: len(found := self.events()) >= count and found)
+
+    def memory_kib(self):
+        for line in Path(f"/proc/{self.process.pid}/status").read_text().splitlines():
+            if line.startswith("VmRSS:"):
+                return int(line.split()[1])
+        raise AssertionError("the service is gone")
+
+    def voluntary_switches(self):
+        """How often the threads of the service went to sleep so far: each is one wake-up."""
+        total = 0
+        for status in Path(f"/proc/{self.process.pid}/task").glob("*/status"):
+            for line in status.read_text().splitlines():
+                if line.startswith("voluntary_ctxt_switches:"):
+                    total += int(line.split()[1])
+        return total
+
+
+class Client:
+    """A client in GLib's own D-Bus implementation, over our socket or over a bus."""
+
+    def __init__(self, connection, destination):
+        self.connection = connection
+        self._destination = destination
+
+    @classmethod
+    def to_socket(cls, address):
+        flags = (Gio.DBusConnectionFlags.AUTHENTICATION_CLIENT
+                 | Gio.DBusConnectionFlags.MESSAGE_BUS_CONNECTION)
+        connection = Gio.DBusConnection.new_for_address_sync(address, flags, None, None)
+        connection.set_exit_on_close(False)
+        return cls(connection, BUS_NAME)
+
+    to_bus = to_socket
+
+    def close(self):
+        with contextlib.suppress(GLib.Error):
+            self.connection.close_sync(None)
+
+    def call(self, member, signature="", *arguments, path=OBJECT, interface=INTERFACE):
+        """One request; its answer as Python values, or GLib.Error."""
+        reply = self.connection.call_sync(
+            self._destination, path, interface, member,
+            GLib.Variant(f"({signature})", arguments) if signature else None,
+            None, Gio.DBusCallFlags.NO_AUTO_START, int(DEADLINE * 1000), None,
+        )
+        values = reply.unpack()
+        return values[0] if len(values) == 1 else values or None
+
+    def call_later(self, member, signature="", *arguments):
+        """One request whose answer is looked at later."""
+        pending = Pending()
+        self.connection.call(
+            self._destination, OBJECT, INTERFACE, member,
+            GLib.Variant(f"({signature})", arguments) if signature else None,
+            None, Gio.DBusCallFlags.NO_AUTO_START, GLib.MAXINT32, None, pending.finish,
+        )
+        return pending
+
+    # The protocol.
+    def create(self, reporter):
+        return self.call("createReportingSession", "x", reporter)
+
+    def set_type(self, service_type, reporter):
+        return self.call("setServiceType", "qx", service_type, reporter)
+
+    def service_type(self, reporter):
+        return self.call("getServiceNameForReporterID", "x", reporter)
+
+    def configure(self, configuration, reporter):
+        return self.call("setConfiguration", "a{sv}x", variants(configuration), reporter)
+
+    def start_later(self, reporter):
+        return self.call_later("startReportingSessionForID", "x", reporter)
+
+    def send(self, message, category=PLAYBACK, event_type=START, reporters=None):
+        return self.call("sendMessage", "a{sv}uqaax", variants(message), category, event_type,
+                         [] if reporters is None else [reporters])
+
+    def stop(self, reporter):
+        return self.call("stopReportingSessionForID", "x", reporter)
+
+    def destroy(self, reporter):
+        return self.call("destroyReportingSession", "x", reporter)
+
+    def valid(self, reporter):
+        return self.call("reporterIDValid", "x", reporter)
+
+    def reporters(self):
+        return self.call("getAllReporters")
+
+
+class Pending:
+    """An answer that is still to come; `place` tells which of several came first."""
+
+    _places = itertools.count()
+
+    def __init__(self):
+        self.value = None
+        self.error = None
+        self.done = False
+        self.place = None
+
+    def finish(self, connection, result):
+        self.place = next(Pending._places)
+        try:
+            values = connection.call_finish(result).unpack()
+            self.value = values[0] if len(values) == 1 else values or None
+        except GLib.Error as error:
+            self.error = error
+        self.done = True
+
+    def wait(self, deadline=DEADLINE):
+        iterate_until("a pending answer", lambda: self.done, deadline)
+        if self.error:
+            raise self.error
+        return self.value
+
+
+def iterate_until(what, condition, deadline=DEADLINE):
+    context = GLib.MainContext.default()
+    end = time.monotonic() + deadline
+    while not condition():
+        if time.monotonic() > end:
+            raise AssertionError(f"waited {deadline:.0f} s in vain for {what}")
+        if not context.iteration(False):
+            time.sleep(0.002)
+
+
+def variants(values):
+    return {key: to_variant(value) for key, value in values.items()}
+
+
+def to_variant(value):
+    if isinstance(value, GLib.Variant):
+        return value
+    if isinstance(value, bool):
+        return GLib.Variant("b", value)
+    if isinstance(value, int):
+        return GLib.Variant("x", value)
+    if isinstance(value, float):
+        return GLib.Variant("d", value)
+    if isinstance(value, str):
+        return GLib.Variant("s", value)
+    if isinstance(value, bytes):
+        return GLib.Variant("ay", value)
+    if isinstance(value, dict):
+        return GLib.Variant("a{sv}", variants(value))
+    if isinstance(value, (list, tuple)):
+        return GLib.Variant("av", [to_variant(item) for item in value])
+    raise TypeError(f"no variant for {value!r}")
+
+
+@contextlib.contextmanager
+def private_bus():
+    """A message bus of our own; gives its address."""
+    directory = tempfile.mkdtemp(prefix="halvox-bus-")
+    process = subprocess.Popen(
+        ["dbus-daemon", "--session", "--nofork", "--print-address=1",
+         f"--address=unix:path={directory}/bus"],
+        stdout=subprocess.PIPE, stderr=subprocess.DEVNULL, text=True,
+    )
+    try:
+        address = process.stdout.readline().strip()
+        if not address:
+            raise AssertionError("dbus-daemon gave no address")
+        yield address
+    finally:
+        stop_process(process)
+        process.stdout.close()
+        shutil.rmtree(directory, ignore_errors=True)
+
+
+def require(*tools):
+    """Skips a test when a program that it needs is not installed."""
+    for tool in tools:
+        if shutil.which(tool) is None:
+            raise unittest.SkipTest(f"{tool} is not installed")

@@ -1,0 +1,113 @@
+"""What the service takes: nothing while idle, bounded memory under a flood, and no one starved."""
+
+import os
+import shutil
+import socket
+import statistics
+import threading
+import time
+import unittest
+
+import harness
+from harness import Client, Service
+from test_hostile import AUTHENTICATION, dictionary_body, frame
+
+IDLE_SECONDS = 10
+FLOOD_SECONDS = 5
+
+
+class Resources(unittest.TestCase):
+    def setUp(self):
+        self.service = Service()
+        self.service.start()
+        self.addCleanup(shutil.rmtree, self.service.directory, True)
+        self.addCleanup(self.service.stop)
+
+    def client(self):
+        client = Client.to_socket(self.service.address)
+        self.addCleanup(client.close)
+        return client
+
+    def test_idle_service_with_idle_clients_does_not_wake_up(self):
+        clients = [self.client() for _ in range(20)]
+        for number, client in enumerate(clients):
+            client.create(number + 1)
+            client.start_later(number + 1)
+            client.send({"a": 1}, reporters=[number + 1])
+        self.service.wait_for_events(40)
+        settled = self.settled_switches()
+
+        time.sleep(IDLE_SECONDS)  # the quantity measured, not a wait for something
+
+        self.assertEqual(self.service.voluntary_switches() - settled, 0)
+
+    def settled_switches(self):
+        """The count once it has stood still for a second."""
+        count = self.service.voluntary_switches()
+        for _ in range(30):
+            time.sleep(1)
+            now = self.service.voluntary_switches()
+            if now == count:
+                return now
+            count = now
+        self.fail("the service does not come to rest")
+
+    def test_flood_is_bounded_and_others_are_still_answered(self):
+        quiet = self.client()
+        idle = self.latencies(quiet, 300)
+        memory = self.service.memory_kib()
+        flooder = Flooder(self.service)
+        self.addCleanup(flooder.stop)
+
+        under_flood = self.latencies(quiet, 300)
+        time.sleep(FLOOD_SECONDS)  # let it try to grow
+        grown = self.service.memory_kib() - memory
+        flooder.stop()
+
+        self.assertGreater(flooder.bytes_sent, 100_000, "there was no flood")
+        self.assertLess(grown, 200 * 1024)
+        print(f"\np99 idle {percentile(idle, 99) * 1e6:.0f} us, "
+              f"under flood {percentile(under_flood, 99) * 1e6:.0f} us; grown {grown} KiB", flush=True)
+
+    def latencies(self, client, count):
+        taken = []
+        for _ in range(count):
+            begin = time.perf_counter()
+            client.valid(1)
+            taken.append(time.perf_counter() - begin)
+        return taken
+
+
+class Flooder:
+    """Pipelines requests as fast as the socket takes them and reads no reply."""
+
+    def __init__(self, service):
+        self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
+        self._socket.connect(str(service.socket))
+        self._socket.sendall(AUTHENTICATION)
+        self.bytes_sent = 0
+        self._stopping = threading.Event()
+        self._socket.settimeout(0.2)
+        self._thread = threading.Thread(target=self._run)
+        self._thread.start()
+
+    def _run(self):
+        batch = frame(dictionary_body(b"key", b"value")) * 100
+        while not self._stopping.is_set():
+            try:
+                self.bytes_sent += self._socket.send(batch)
+            except TimeoutError:
+                continue  # the service reads no more: as it should
+
+    def stop(self):
+        self._stopping.set()
+        self._thread.join()
+        self._socket.close()
+
+
+def percentile(values, percent):
+    return statistics.quantiles(values, n=100)[percent - 1]
+
+
+if __name__ == "__main__":
+    unittest.main()
