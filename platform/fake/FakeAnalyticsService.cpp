@@ -1,0 +1,89 @@
+#include "platform/fake/FakeAnalyticsService.h"
+
+#include <utility>
+
+namespace halvox::platform {
+
+void FakeAnalyticsService::wantEverything() {
+  const std::lock_guard lock(mutex_);
+  wanted_.reset();
+}
+
+void FakeAnalyticsService::wantOnly(std::set<std::string, std::less<>> names) {
+  const std::lock_guard lock(mutex_);
+  wanted_ = std::move(names);
+}
+
+void FakeAnalyticsService::setBuilding(Building building) {
+  const std::lock_guard lock(mutex_);
+  building_ = building;
+}
+
+void FakeAnalyticsService::buildPayloads() {
+  for (std::size_t index = 0;; ++index) {
+    AnalyticsPayloadBuilder builder;
+    {
+      const std::lock_guard lock(mutex_);
+      if (index >= records_.size()) return;
+      builder = std::exchange(records_[index].builder, nullptr);
+    }
+    if (!builder) continue;
+    Dictionary payload = builder();  // without the lock: a builder may call anything
+    const std::lock_guard lock(mutex_);
+    if (index < records_.size()) records_[index].event.payload = std::move(payload);
+  }
+}
+
+void FakeAnalyticsService::clear() {
+  std::vector<Record> dropped;  // destroyed without the lock: builders own sessions
+  const std::lock_guard lock(mutex_);
+  dropped.swap(records_);
+  tested_.clear();
+}
+
+std::vector<FakeAnalyticsService::Event> FakeAnalyticsService::events() const {
+  const std::lock_guard lock(mutex_);
+  std::vector<Event> result;
+  for (const Record& record : records_) result.push_back(record.event);
+  return result;
+}
+
+std::vector<FakeAnalyticsService::Event> FakeAnalyticsService::events(std::string_view name) const {
+  std::vector<Event> result = events();
+  std::erase_if(result, [name](const Event& event) { return event.name != name; });
+  return result;
+}
+
+std::vector<std::string> FakeAnalyticsService::sentNames() const {
+  std::vector<std::string> names;
+  for (Event& event : events()) names.push_back(std::move(event.name));
+  return names;
+}
+
+std::vector<std::string> FakeAnalyticsService::testedNames() const {
+  const std::lock_guard lock(mutex_);
+  return tested_;
+}
+
+bool FakeAnalyticsService::isAnalyticsEventUsed(std::string_view eventName) {
+  journal_.record(JournalKind::kAnalyticsTest, eventName);
+  const std::lock_guard lock(mutex_);
+  tested_.emplace_back(eventName);
+  return !wanted_.has_value() || wanted_->contains(eventName);
+}
+
+void FakeAnalyticsService::sendAnalyticsEventLazy(std::string eventName,
+                                                  AnalyticsPayloadBuilder builder) {
+  journal_.record(JournalKind::kAnalyticsEvent, eventName);
+  std::optional<Dictionary> payload;
+  bool buildNow = false;
+  {
+    const std::lock_guard lock(mutex_);
+    buildNow = building_ == Building::kWhenSent;
+  }
+  if (buildNow) payload = std::exchange(builder, nullptr)();
+  const std::lock_guard lock(mutex_);
+  records_.push_back({{std::move(eventName), std::move(payload)}, std::move(builder)});
+}
+
+}  // namespace halvox::platform

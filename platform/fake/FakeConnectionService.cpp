@@ -1,0 +1,154 @@
+#include "platform/fake/FakeConnectionService.h"
+
+#include <algorithm>
+#include <stdexcept>
+#include <utility>
+
+namespace halvox::platform {
+namespace {
+
+// What is being delivered on this thread.
+thread_local const NSXPCConnection* deliveringConnection = nullptr;
+thread_local RequestToken deliveringRequest;
+
+class DeliveryMark {
+ public:
+  DeliveryMark(const NSXPCConnection& connection, RequestToken request)
+      : outerConnection_(std::exchange(deliveringConnection, &connection)),
+        outerRequest_(std::exchange(deliveringRequest, std::move(request))) {}
+  DeliveryMark(const DeliveryMark&) = delete;
+  DeliveryMark& operator=(const DeliveryMark&) = delete;
+  ~DeliveryMark() {
+    deliveringConnection = outerConnection_;
+    deliveringRequest = std::move(outerRequest_);
+  }
+
+ private:
+  const NSXPCConnection* outerConnection_;
+  RequestToken outerRequest_;
+};
+
+// Reads one complete type of a D-Bus signature; the position behind it.
+std::size_t skipType(std::string_view signature, std::size_t position) {
+  if (signature.at(position) == 'a') return skipType(signature, position + 1);
+  int depth = 0;
+  do {
+    const char symbol = signature.at(position++);
+    if (symbol == '(' || symbol == '{') ++depth;
+    if (symbol == ')' || symbol == '}') --depth;
+  } while (depth > 0);
+  return position;
+}
+
+std::size_t countTypes(std::string_view signature) {
+  std::size_t count = 0;
+  for (std::size_t at = 0; at < signature.size(); at = skipType(signature, at)) ++count;
+  return count;
+}
+
+const InterfaceMethod& methodNamed(const NSXPCInterface& interface, std::string_view name) {
+  const auto method = std::ranges::find(interface.methods, name, &InterfaceMethod::name);
+  if (method == interface.methods.end()) {
+    throw std::invalid_argument("the exported interface has no method " + std::string(name));
+  }
+  return *method;
+}
+
+}  // namespace
+
+std::vector<FakeCall::Reply> FakeCall::replies() const {
+  const std::lock_guard lock(mutex_);
+  return replies_;
+}
+
+Value FakeCall::value() const {
+  const std::vector<Reply> all = replies();
+  if (all.size() != 1 || all.front().error.has_value()) {
+    throw std::logic_error(method_ + " was not answered once and without error");
+  }
+  return all.front().value;
+}
+
+void FakeCall::add(const std::optional<Error>& error, const Value& value) {
+  journal_.record(JournalKind::kReply, method_);
+  const std::lock_guard lock(mutex_);
+  replies_.push_back({error, value});
+}
+
+std::shared_ptr<FakeCall> FakeConnection::call(std::string_view method,
+                                               std::vector<Value> arguments) {
+  if (!resumed_ || ended_ || interface_ == nullptr || object_ == nullptr) {
+    throw std::logic_error("a request on a connection that delivers none");
+  }
+  const InterfaceMethod& target = methodNamed(*interface_, method);
+  if (countTypes(target.in) != arguments.size()) {
+    throw std::invalid_argument("wrong number of arguments for " + std::string(method));
+  }
+  auto call = std::make_shared<FakeCall>(journal_, std::string(method));
+  const std::shared_ptr<ExportedObject> object = object_;  // a request may end the connection
+  const DeliveryMark mark(*this, std::make_shared<std::shared_ptr<int>>(openRequests_));
+  target.invoke(*object, {arguments, [call](const std::optional<Error>& error, const Value& value) {
+                            call->add(error, value);
+                          }});
+  return call;
+}
+
+void FakeConnection::interrupt() {
+  const DeliveryMark mark(*this, nullptr);
+  if (!ended_ && interruptionHandler_) interruptionHandler_();
+}
+
+void FakeConnection::invalidate() {
+  if (std::exchange(ended_, true)) return;
+  const DeliveryMark mark(*this, nullptr);
+  if (invalidationHandler_) invalidationHandler_();
+  interruptionHandler_ = nullptr;
+  invalidationHandler_ = nullptr;
+  object_.reset();
+}
+
+std::size_t FakeConnection::openRequests() const {
+  return static_cast<std::size_t>(openRequests_.use_count()) - 1;
+}
+
+std::string FakeConnection::description() const {
+  return "<FakeConnection pid " + std::to_string(pid_) + ">";
+}
+
+void FakeConnection::setExportedObject(std::shared_ptr<ExportedObject> object) {
+  object_ = std::move(object);
+}
+
+void FakeConnection::setInterruptionHandler(std::function<void()> handler) {
+  interruptionHandler_ = std::move(handler);
+}
+
+void FakeConnection::setInvalidationHandler(std::function<void()> handler) {
+  invalidationHandler_ = std::move(handler);
+}
+
+std::shared_ptr<FakeConnection> FakeConnectionService::connect(ProcessID pid) {
+  if (listener_.delegate() == nullptr) throw std::logic_error("the listener has no delegate");
+  auto connection = std::make_shared<FakeConnection>(journal_, pid);
+  connections_.push_back(connection);
+  connection->accepted_ = listener_.delegate()->listenerShouldAcceptNewConnection(connection);
+  return connection;
+}
+
+void FakeConnectionService::clear() {
+  for (const std::shared_ptr<FakeConnection>& connection : connections_) {
+    connection->ended_ = true;
+    connection->interruptionHandler_ = nullptr;
+    connection->invalidationHandler_ = nullptr;
+    connection->object_.reset();
+  }
+  connections_.clear();
+}
+
+const NSXPCConnection* FakeConnectionService::currentConnection() const {
+  return deliveringConnection;
+}
+
+RequestToken FakeConnectionService::currentRequest() const { return deliveringRequest; }
+
+}  // namespace halvox::platform

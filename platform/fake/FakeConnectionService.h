@@ -1,0 +1,125 @@
+#pragma once
+
+#include <cstddef>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/connection.h"
+#include "platform/fake/Journal.h"
+
+namespace halvox::platform {
+
+// One request of a fake client and the answers that it got. Shared by the test and the reply
+// callback. Unlike the wire it has room for any number of answers, so that tests can count them.
+class FakeCall {
+ public:
+  struct Reply {
+    std::optional<Error> error;
+    Value value;
+    friend bool operator==(const Reply&, const Reply&) = default;
+  };
+
+  FakeCall(Journal& journal, std::string method) : journal_(journal), method_(std::move(method)) {}
+
+  [[nodiscard]] std::vector<Reply> replies() const;
+  [[nodiscard]] bool isAnswered() const { return !replies().empty(); }
+  // The value of the only answer; throws when there is none, several, or an error.
+  [[nodiscard]] Value value() const;
+  void add(const std::optional<Error>& error, const Value& value);
+
+ private:
+  Journal& journal_;
+  const std::string method_;
+  mutable std::mutex mutex_;
+  std::vector<Reply> replies_;
+};
+
+class FakeConnectionService;
+
+// A client's connection that the test plays: it sends requests, is interrupted and goes away.
+// All on the thread of the test, which stands for the connection's thread. Held by the service
+// until it is invalidated, and by the test.
+class FakeConnection final : public NSXPCConnection {
+ public:
+  FakeConnection(Journal& journal, ProcessID pid) : journal_(journal), pid_(pid) {}
+
+  // Delivers a request to the exported object and returns it with the answers so far; later answers
+  // are added to it. Throws when the connection was not resumed, has ended, has no such method, or
+  // when the number of arguments is not that of the method's signature.
+  std::shared_ptr<FakeCall> call(std::string_view method, std::vector<Value> arguments = {});
+  // The other end is gone though the connection might come back.
+  void interrupt();
+  // The connection has ended for good: calls the handler once, then lets go of the exported object.
+  void invalidate();
+
+  // How many requests are still being carried out.
+  [[nodiscard]] std::size_t openRequests() const;
+  [[nodiscard]] bool isResumed() const { return resumed_; }
+  [[nodiscard]] bool isAccepted() const { return accepted_; }
+  [[nodiscard]] const NSXPCInterface* exportedInterface() const { return interface_; }
+  [[nodiscard]] const std::shared_ptr<ExportedObject>& exportedObject() const { return object_; }
+
+  [[nodiscard]] ProcessID processIdentifier() const override { return pid_; }
+  [[nodiscard]] std::string description() const override;
+  void setExportedInterface(const NSXPCInterface& interface) override { interface_ = &interface; }
+  void setExportedObject(std::shared_ptr<ExportedObject> object) override;
+  void setInterruptionHandler(std::function<void()> handler) override;
+  void setInvalidationHandler(std::function<void()> handler) override;
+  void resume() override { resumed_ = true; }
+
+ private:
+  friend class FakeConnectionService;
+
+  Journal& journal_;
+  const ProcessID pid_;
+  bool accepted_ = false;
+  bool resumed_ = false;
+  bool ended_ = false;
+  const NSXPCInterface* interface_ = nullptr;
+  std::shared_ptr<ExportedObject> object_;
+  std::function<void()> interruptionHandler_;
+  std::function<void()> invalidationHandler_;
+  std::shared_ptr<int> openRequests_ = std::make_shared<int>();  // one more owner per open request
+};
+
+// A listener that accepts nothing by itself.
+class FakeListener final : public NSXPCListener {
+ public:
+  [[nodiscard]] NSXPCListenerDelegate* delegate() const { return delegate_; }
+  [[nodiscard]] bool isResumed() const { return resumed_; }
+
+  void setDelegate(NSXPCListenerDelegate& delegate) override { delegate_ = &delegate; }
+  // Returns at once, unlike a real one.
+  void resume() override { resumed_ = true; }
+
+ private:
+  NSXPCListenerDelegate* delegate_ = nullptr;
+  bool resumed_ = false;
+};
+
+// Connections that the test makes.
+class FakeConnectionService final : public ConnectionService {
+ public:
+  // Does not own the journal, which must outlive it.
+  explicit FakeConnectionService(Journal& journal) : journal_(journal) {}
+
+  // A new client of that process: shows the connection to the listener's delegate and returns it
+  // whether it was accepted or not. Throws when the listener has no delegate.
+  std::shared_ptr<FakeConnection> connect(ProcessID pid);
+  // Lets go of all connections without calling their handlers.
+  void clear();
+
+  [[nodiscard]] FakeListener& serviceListener() override { return listener_; }
+  [[nodiscard]] const NSXPCConnection* currentConnection() const override;
+  [[nodiscard]] RequestToken currentRequest() const override;
+
+ private:
+  Journal& journal_;
+  FakeListener listener_;
+  std::vector<std::shared_ptr<FakeConnection>> connections_;
+};
+
+}  // namespace halvox::platform

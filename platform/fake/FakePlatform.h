@@ -1,0 +1,40 @@
+#pragma once
+
+#include "platform/fake/FakeAnalyticsService.h"
+#include "platform/fake/FakeClockService.h"
+#include "platform/fake/FakeConnectionService.h"
+#include "platform/fake/FakeDevicePropertyService.h"
+#include "platform/fake/FakeDispatchService.h"
+#include "platform/fake/FakeFeatureFlagService.h"
+#include "platform/fake/FakeKdebugService.h"
+#include "platform/fake/FakeLogService.h"
+#include "platform/fake/FakeProcessService.h"
+#include "platform/fake/FakeStatisticsService.h"
+#include "platform/fake/Journal.h"
+
+namespace halvox::platform {
+
+// One fake of each platform service, installed as long as it lives. A test fixture has it as its
+// first member, so that it outlives what is tested. One at a time.
+struct FakePlatform {
+  FakePlatform();
+  FakePlatform(const FakePlatform&) = delete;
+  FakePlatform& operator=(const FakePlatform&) = delete;
+  // Drops connections and jobs that did not run while all services are still there, because the
+  // destructors of what they held may call them.
+  ~FakePlatform();
+
+  Journal journal;
+  FakeClockService clock;
+  FakeLogService log{journal};
+  FakeStatisticsService statistics;
+  FakeKdebugService kdebug{journal};
+  FakeProcessService process{journal};
+  FakeDevicePropertyService deviceProperties;
+  FakeFeatureFlagService featureFlags;
+  FakeAnalyticsService analytics{journal};
+  FakeDispatchService dispatch{clock};
+  FakeConnectionService connections{journal};
+};
+
+}  // namespace halvox::platform

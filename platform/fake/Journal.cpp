@@ -1,0 +1,47 @@
+#include "platform/fake/Journal.h"
+
+#include <algorithm>
+#include <ostream>
+
+namespace halvox::platform {
+
+void Journal::record(JournalKind kind, std::string_view text) {
+  const std::lock_guard lock(mutex_);
+  entries_.push_back({kind, std::string(text)});
+}
+
+void Journal::clear() {
+  const std::lock_guard lock(mutex_);
+  entries_.clear();
+}
+
+std::vector<JournalEntry> Journal::entries() const {
+  const std::lock_guard lock(mutex_);
+  return entries_;
+}
+
+std::vector<JournalEntry> Journal::entries(std::initializer_list<JournalKind> kinds) const {
+  std::vector<JournalEntry> chosen = entries();
+  std::erase_if(chosen, [kinds](const JournalEntry& entry) {
+    return std::ranges::find(kinds, entry.kind) == kinds.end();
+  });
+  return chosen;
+}
+
+std::vector<std::string> Journal::texts() const {
+  std::vector<std::string> result;
+  for (JournalEntry& entry : entries()) result.push_back(std::move(entry.text));
+  return result;
+}
+
+std::vector<std::string> Journal::texts(JournalKind kind) const {
+  std::vector<std::string> result;
+  for (JournalEntry& entry : entries({kind})) result.push_back(std::move(entry.text));
+  return result;
+}
+
+void PrintTo(const JournalEntry& entry, std::ostream* stream) {
+  *stream << '{' << static_cast<int>(entry.kind) << ", \"" << entry.text << "\"}";
+}
+
+}  // namespace halvox::platform

@@ -1,0 +1,51 @@
+#pragma once
+
+#include <mutex>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace halvox::platform {
+
+// What a journal entry tells of.
+enum class JournalKind : unsigned char {
+  kLogLine,         // text: the line without its prefix
+  kTracePoint,      // text: the code as "0x21044828"
+  kAnalyticsTest,   // text: the name that was asked for
+  kAnalyticsEvent,  // text: the name that was sent
+  kReply,           // text: the name of the method that was answered
+  kTermination,     // text: the exit status
+  kNote,            // text: whatever the test wrote
+};
+
+struct JournalEntry {
+  JournalKind kind;
+  std::string text;
+  friend bool operator==(const JournalEntry&, const JournalEntry&) = default;
+};
+
+// The order in which things reached the fakes, over all of them, so that a test can check the order
+// of steps that go to different services. Any thread may record.
+class Journal {
+ public:
+  void record(JournalKind kind, std::string_view text);
+  // Lets a test mark its own steps.
+  void note(std::string_view text) { record(JournalKind::kNote, text); }
+  void clear();
+
+  [[nodiscard]] std::vector<JournalEntry> entries() const;
+  // The entries of the kinds named, in their order.
+  [[nodiscard]] std::vector<JournalEntry> entries(std::initializer_list<JournalKind> kinds) const;
+  // The texts of all entries, or of those of one kind, in their order.
+  [[nodiscard]] std::vector<std::string> texts() const;
+  [[nodiscard]] std::vector<std::string> texts(JournalKind kind) const;
+
+ private:
+  mutable std::mutex mutex_;
+  std::vector<JournalEntry> entries_;
+};
+
+// For the messages of failed tests.
+void PrintTo(const JournalEntry& entry, std::ostream* stream);
+
+}  // namespace halvox::platform
