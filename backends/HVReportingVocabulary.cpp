@@ -1,0 +1,35 @@
+#include "backends/HVReportingVocabulary.h"
+
+#include "platform/log.h"
+#include "platform/services.h"
+
+namespace halvox {
+namespace {
+
+platform::LogCategory& makeCategory(std::string_view name) {
+  return platform::log().createCategory(kHVReportingLogSubsystem, name);
+}
+
+}  // namespace
+
+platform::LogCategory& HVReportingClientCategory() {
+  static platform::LogCategory& category = makeCategory("hvrc");
+  return category;
+}
+
+platform::LogCategory& HVReportingServiceDelegateCategory() {
+  static platform::LogCategory& category = makeCategory("hvrs");
+  return category;
+}
+
+platform::LogCategory& HVReportingSessionCategory() {
+  static platform::LogCategory& category = makeCategory("hvrr");
+  return category;
+}
+
+platform::LogCategory& HVReportingSessionTLMReportingCategory() {
+  static platform::LogCategory& category = makeCategory("hvri");
+  return category;
+}
+
+}  // namespace halvox
