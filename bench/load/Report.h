@@ -1,0 +1,31 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace halvox::bench {
+
+// One measured quantity; beside it, where it makes sense, the same of the echo in the same run.
+struct Measurement {
+  std::string name;
+  std::string unit;
+  double value = 0;
+  std::optional<double> echo;
+  // The bound that the ratio (with an echo) or the value (without) is held to, and its direction.
+  std::optional<double> atMost;
+  std::optional<double> atLeast;
+
+  // value / echo, or the value itself.
+  [[nodiscard]] double compared() const;
+  [[nodiscard]] bool holds() const;
+};
+
+// All measurements as a table for people, and as JSON.
+std::string formatTable(const std::vector<Measurement>& measurements);
+std::string formatJson(const std::vector<Measurement>& measurements);
+
+double median(std::vector<double> values);
+double percentile(std::vector<double> values, double percent);
+
+}  // namespace halvox::bench

@@ -1,0 +1,257 @@
+#include "bench/load/Scenarios.h"
+
+#include <atomic>
+#include <chrono>
+#include <ctime>
+#include <fstream>
+#include <functional>
+#include <memory>
+#include <thread>
+
+#include "bench/load/Process.h"
+
+namespace halvox::bench {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+double micros(std::chrono::nanoseconds time) {
+  return std::chrono::duration<double, std::micro>(time).count();
+}
+
+std::chrono::nanoseconds ownThreadCpu() {
+  timespec time{};
+  ::clock_gettime(CLOCK_THREAD_CPUTIME_ID, &time);
+  return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
+}
+
+enum class Kind : std::uint8_t { kEcho, kStored, kUnwanted };
+
+// A server of either kind with a directory of its own.
+class Server {
+ public:
+  Server(const LoadOptions& options, Kind kind)
+      : kind_(kind), socket_(directory_.path() + "/s"), process_(start(options, kind)) {
+    process_->waitForSocket(socket_);
+  }
+
+  [[nodiscard]] std::unique_ptr<LoadClient> client(std::int64_t reporter) const {
+    return std::make_unique<LoadClient>(socket_, reporter, kind_ != Kind::kEcho);
+  }
+  [[nodiscard]] std::unique_ptr<LoadClient> idleClient() const {
+    return std::make_unique<LoadClient>(socket_, 0, false);
+  }
+  [[nodiscard]] const Process& process() const { return *process_; }
+
+ private:
+  std::unique_ptr<Process> start(const LoadOptions& options, Kind kind) {
+    if (kind == Kind::kEcho) {
+      return std::make_unique<Process>(std::vector<std::string>{options.self, "--echo", socket_},
+                                       std::vector<std::string>{});
+    }
+    const std::string config = directory_.path() + "/halvox.toml";
+    std::ofstream(config) << "[listener]\nsocket = \"" << socket_ << "\"\n[storage]\ndirectory = \""
+                          << directory_.path() << "/state\"\nmax_megabytes = 8192\n"
+                          << "[analytics]\nwanted = [" << (kind == Kind::kStored ? "\"*\"" : "")
+                          << "]\n[limits]\nclient_history_megabytes = 65536\n"
+                          << "client_sessions = 1000000\n[log]\nlevel = \"error\"\n";
+    return std::make_unique<Process>(std::vector<std::string>{options.service},
+                                     std::vector<std::string>{"HALVOX_CONFIG=" + config});
+  }
+
+  Kind kind_;
+  ScratchDirectory directory_;
+  std::string socket_;
+  std::unique_ptr<Process> process_;
+};
+
+struct Cost {
+  double messagesPerSecond;
+  double serverMicros;
+  double clientMicros;
+};
+
+// What `count` messages of one pipelining client cost, the server's later work included.
+Cost pipelineCost(const Server& server, LoadClient& client, const LoadOptions& options,
+                  std::int64_t count) {
+  const auto serverBefore = server.process().settledCpuTime();
+  const auto clientBefore = ownThreadCpu();
+  const auto begin = Clock::now();
+  client.pipeline(count, options.window, options.shape);
+  const double seconds = std::chrono::duration<double>(Clock::now() - begin).count();
+  const auto clientCpu = ownThreadCpu() - clientBefore;
+  const auto serverCpu = server.process().settledCpuTime() - serverBefore;
+  const auto messages = static_cast<double>(count);
+  return {messages / seconds, micros(serverCpu) / messages, micros(clientCpu) / messages};
+}
+
+Cost oneRun(const LoadOptions& options, Kind kind) {
+  const Server server(options, kind);
+  const auto client = server.client(1);
+  client->pipeline(5000, options.window, options.shape);  // warm caches and pools
+  return pipelineCost(server, *client, options, options.messages);
+}
+
+double medianOf(const std::vector<Cost>& costs, double Cost::*member) {
+  std::vector<double> values;
+  for (const Cost& cost : costs) values.push_back(cost.*member);
+  return median(values);
+}
+
+// Pings while other clients keep the server busy.
+std::vector<double> pingUnderLoad(const Server& server, const LoadOptions& options, int count) {
+  std::atomic<bool> stopping{false};
+  std::vector<std::thread> busy;
+  for (int number = 0; number < options.clients; ++number) {
+    busy.emplace_back([&server, &options, &stopping, number] {
+      MessageShape repeated = options.shape;
+      repeated.content = Content::kRepeated;
+      const auto client = server.client(100 + number);
+      while (!stopping) client->pipeline(1000, options.window, repeated);
+    });
+  }
+  const auto client = server.client(1);
+  std::vector<double> latencies = client->ping(count, options.shape);
+  stopping = true;
+  for (std::thread& thread : busy) thread.join();
+  return latencies;
+}
+
+double serverMicrosAfter(const LoadOptions& options,
+                         const std::function<void(const Server&, LoadClient&)>& prepare) {
+  const Server server(options, Kind::kUnwanted);
+  const auto client = server.client(1);
+  client->pipeline(5000, options.window, options.shape);
+  prepare(server, *client);
+  return pipelineCost(server, *client, options, options.messages / 2).serverMicros;
+}
+
+}  // namespace
+
+void measureThroughput(const LoadOptions& options, std::vector<Measurement>& results) {
+  std::vector<Cost> echo;
+  std::vector<Cost> stored;
+  std::vector<Cost> unwanted;
+  for (int round = 0; round < options.rounds; ++round) {
+    echo.push_back(oneRun(options, Kind::kEcho));
+    stored.push_back(oneRun(options, Kind::kStored));
+    unwanted.push_back(oneRun(options, Kind::kUnwanted));
+  }
+  const auto add = [&](const char* name, const char* unit, const std::vector<Cost>& costs,
+                       double Cost::*member, std::optional<double> atMost,
+                       std::optional<double> atLeast) {
+    results.push_back(
+        {name, unit, medianOf(costs, member), medianOf(echo, member), atMost, atLeast});
+  };
+  add("throughput, both events stored", "messages/s", stored, &Cost::messagesPerSecond, {}, 0.55);
+  add("service CPU, both events stored", "us/message", stored, &Cost::serverMicros, 1.9, {});
+  add("client CPU, both events stored", "us/message", stored, &Cost::clientMicros, {}, {});
+  add("throughput, no event wanted", "messages/s", unwanted, &Cost::messagesPerSecond, {}, 0.75);
+  add("service CPU, no event wanted", "us/message", unwanted, &Cost::serverMicros, 1.3, {});
+  add("client CPU, no event wanted", "us/message", unwanted, &Cost::clientMicros, {}, {});
+}
+
+void measureLatency(const LoadOptions& options, std::vector<Measurement>& results) {
+  constexpr int kPings = 4000;
+  const auto add = [&](const char* name, const std::vector<double>& service,
+                       const std::vector<double>& echo, double percent,
+                       std::optional<double> atMost) {
+    results.push_back({name,
+                       "us",
+                       percentile(service, percent) * 1e6,
+                       percentile(echo, percent) * 1e6,
+                       atMost,
+                       {}});
+  };
+  const Server echo(options, Kind::kEcho);
+  const Server service(options, Kind::kStored);
+  const auto idle = [&](const Server& server) {
+    return server.client(1)->ping(kPings, options.shape);
+  };
+  const auto echoIdle = idle(echo);
+  const auto serviceIdle = idle(service);
+  add("reply latency p50, one call a millisecond", serviceIdle, echoIdle, 50, 1.5);
+  add("reply latency p99, one call a millisecond", serviceIdle, echoIdle, 99, 2.0);
+  const auto echoLoaded = pingUnderLoad(echo, options, kPings / 4);
+  const auto serviceLoaded = pingUnderLoad(service, options, kPings / 4);
+  add("reply latency p50 under load", serviceLoaded, echoLoaded, 50, {});
+  add("reply latency p99 under load", serviceLoaded, echoLoaded, 99, {});
+}
+
+void measureMemory(const LoadOptions& options, std::vector<Measurement>& results) {
+  {
+    const Server server(options, Kind::kStored);
+    std::vector<std::thread> busy;
+    for (int number = 0; number < options.clients; ++number) {
+      busy.emplace_back([&, number] {
+        // Repeated messages are recorded by the store but not in the session's history, whose
+        // memory is measured below.
+        MessageShape repeated = options.shape;
+        repeated.content = Content::kRepeated;
+        server.client(1 + number)->pipeline(options.messages / 2, options.window, repeated);
+      });
+    }
+    for (std::thread& thread : busy) thread.join();
+    results.push_back(
+        {"resident memory after " + std::to_string(options.clients) + " clients at full speed",
+         "MiB",
+         static_cast<double>(server.process().residentKib()) / 1024,
+         {},
+         24.0,
+         {}});
+  }
+  const Server server(options, Kind::kUnwanted);
+  const auto client = server.client(1);
+  client->pipeline(5000, options.window, options.shape);
+  const long before = server.process().residentKib();
+  client->pipeline(options.messages, options.window, options.shape);
+  const auto grown = static_cast<double>(server.process().residentKib() - before) * 1024;
+  results.push_back({"history, per message of " + std::to_string(options.shape.fields) + " fields",
+                     "bytes",
+                     grown / static_cast<double>(options.messages),
+                     {},
+                     500.0,
+                     {}});
+}
+
+void measureGrowth(const LoadOptions& options, std::vector<Measurement>& results) {
+  constexpr std::int64_t kSessions = 10'000;
+  constexpr int kClients = 1000;
+  constexpr std::int64_t kHistory = 1'000'000;
+  const double alone = serverMicrosAfter(options, [](const Server&, LoadClient&) {});
+  const auto add = [&](const std::string& name, double value) {
+    results.push_back(
+        {"service CPU " + name + ", times that with one", "x", value / alone, {}, 1.2, {}});
+  };
+  add("with 10,000 sessions", serverMicrosAfter(options, [](const Server&, LoadClient& client) {
+        client.createSessions(1000, kSessions);
+      }));
+  std::vector<std::unique_ptr<LoadClient>> idle;
+  add("with 1,000 clients", serverMicrosAfter(options, [&idle](const Server& server, LoadClient&) {
+        for (int number = 0; number < kClients; ++number) {
+          idle.push_back(server.client(10'000 + number));
+        }
+      }));
+  idle.clear();
+  add("with 1,000,000 messages of history",
+      serverMicrosAfter(options, [&options](const Server&, LoadClient& client) {
+        client.pipeline(kHistory, options.window, options.shape);
+      }));
+}
+
+void measureIdle(const LoadOptions& options, std::vector<Measurement>& results) {
+  const Server server(options, Kind::kStored);
+  const auto client = server.client(1);
+  client->pipeline(1000, options.window, options.shape);
+  (void)server.process().settledCpuTime();
+  const long before = server.process().sleeps();
+  std::this_thread::sleep_for(std::chrono::seconds(10));
+  results.push_back({"wake-ups in 10 idle seconds",
+                     "",
+                     static_cast<double>(server.process().sleeps() - before),
+                     {},
+                     0.0,
+                     {}});
+}
+
+}  // namespace halvox::bench

@@ -1,0 +1,29 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "bench/load/LoadClient.h"
+#include "bench/load/Report.h"
+
+namespace halvox::bench {
+
+struct LoadOptions {
+  std::string service;  // the program under measurement
+  std::string self;     // this program, which is the echo too
+  std::int64_t messages = 200'000;
+  std::int64_t window = 64;
+  int clients = 4;  // for memory and latency under load
+  int rounds = 3;   // throughput is measured so often, echo and service in turn
+  MessageShape shape;
+};
+
+// Each runs servers of its own, appends what it measured and leaves nothing running.
+void measureThroughput(const LoadOptions& options, std::vector<Measurement>& results);
+void measureLatency(const LoadOptions& options, std::vector<Measurement>& results);
+void measureMemory(const LoadOptions& options, std::vector<Measurement>& results);
+void measureGrowth(const LoadOptions& options, std::vector<Measurement>& results);
+void measureIdle(const LoadOptions& options, std::vector<Measurement>& results);
+
+}  // namespace halvox::bench
