@@ -5,7 +5,6 @@
 #include <charconv>
 #include <concepts>
 #include <cstdint>
-#include <source_location>
 #include <string>
 #include <string_view>
 
@@ -85,11 +84,11 @@ class UnitLog {
 
   // The first part of a line, which also remembers where the line is logged.
   struct Text {
+    // The builtin is what std::source_location is made of, which clang 14 lacks.
     // NOLINTNEXTLINE(google-explicit-constructor): so that call sites read as plain text
-    Text(const char* first, std::source_location where = std::source_location::current())
-        : text(first), location(where) {}
+    Text(const char* first, std::uint32_t where = __builtin_LINE()) : text(first), line(where) {}
     const char* text;
-    std::source_location location;
+    std::uint32_t line;
   };
 
   template <typename... Parts>
@@ -115,7 +114,7 @@ class UnitLog {
   void log(LogLevel level, const Text& text, const Parts&... parts) const {
     LogCategory& category = category_();
     if (!category.isEnabled(level)) return;
-    std::string line = detail::logPrefix(unit_, text.location.line());
+    std::string line = detail::logPrefix(unit_, text.line);
     line += text.text;
     (detail::appendLogPart(line, parts), ...);
     category.write(level, line);
