@@ -109,15 +109,21 @@ class UnitLog {
   }
   [[nodiscard]] bool isDebugEnabled() const { return category_().isEnabled(LogLevel::kDebug); }
 
- private:
+  // The same for a unit whose caller chooses the category.
   template <typename... Parts>
-  void log(LogLevel level, const Text& text, const Parts&... parts) const {
-    LogCategory& category = category_();
+  static void logTo(LogCategory& category, std::string_view unit, LogLevel level, const Text& text,
+                    const Parts&... parts) {
     if (!category.isEnabled(level)) return;
-    std::string line = detail::logPrefix(unit_, text.line);
+    std::string line = detail::logPrefix(unit, text.line);
     line += text.text;
     (detail::appendLogPart(line, parts), ...);
     category.write(level, line);
+  }
+
+ private:
+  template <typename... Parts>
+  void log(LogLevel level, const Text& text, const Parts&... parts) const {
+    logTo(category_(), unit_, level, text, parts...);
   }
 
   CategoryAccessor category_;

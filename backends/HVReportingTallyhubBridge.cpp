@@ -1,0 +1,70 @@
+#include "backends/HVReportingTallyhubBridge.h"
+
+#include <array>
+#include <initializer_list>
+#include <string>
+#include <string_view>
+#include <utility>
+
+#include "backends/HVReportingUtility.h"
+#include "platform/analytics.h"
+#include "platform/services.h"
+#include "session/HVReportingSession.h"
+
+namespace halvox {
+
+using platform::Dictionary;
+using platform::Key;
+using platform::Message;
+
+namespace {
+
+// An event's name, put together without allocation: most names are only asked for, never sent.
+class EventName {
+ public:
+  EventName(std::initializer_list<std::string_view> parts) {
+    for (const std::string_view part : parts) {
+      length_ += part.copy(text_.data() + length_, text_.size() - length_);
+    }
+  }
+  [[nodiscard]] std::string_view text() const { return {text_.data(), length_}; }
+
+ private:
+  // The longest name, of PlaybackAndRecord and HeadphoneAudioExposure, has 75 characters.
+  std::array<char, 128> text_;
+  std::size_t length_ = 0;
+};
+
+Dictionary makePayload(const Message& message, const HVReportingSession& session) {
+  static const Key key("HostApplicationDisplayID");
+  Dictionary payload = message.value_or(Dictionary{});
+  payload.set(key, HVReportingUtilityRetrieveAppName(session.configuration()));
+  return payload;
+}
+
+void sendIfUsed(std::string_view name, const Message& message,
+                const std::shared_ptr<HVReportingSession>& session) {
+  platform::AnalyticsService& analytics = platform::analytics();
+  if (!analytics.isAnalyticsEventUsed(name)) return;
+  analytics.sendAnalyticsEventLazy(std::string(name),
+                                   [message, session] { return makePayload(message, *session); });
+}
+
+}  // namespace
+
+void HVReportingTallyhubBridge::handleEvent(const Message& message, AudioEventCategory category,
+                                            AudioEventType type,
+                                            const std::shared_ptr<HVReportingSession>& session) {
+  const HVReportingCategoryText categoryText = HVReportingUtilityCategoryTextParts(category);
+  const std::string_view typeText = HVReportingUtilityTypeString(type);
+  const std::string_view serviceName =
+      HVReportingUtilityGenerateServiceNameFromServiceType(session->serviceType());
+
+  const EventName ofAll{"com.tarno.halvox.", categoryText.domain, categoryText.name, ".", typeText};
+  const EventName ofService{"com.tarno.",      serviceName, ".",     categoryText.domain,
+                            categoryText.name, ".",         typeText};
+  sendIfUsed(ofAll.text(), message, session);
+  sendIfUsed(ofService.text(), message, session);
+}
+
+}  // namespace halvox
