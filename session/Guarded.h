@@ -1,0 +1,50 @@
+#pragma once
+
+#include <mutex>
+#include <utility>
+
+namespace halvox {
+
+// A value that can be reached only while its lock is held, so no reader sees it half written.
+// The lock is short and not recursive: nothing that waits belongs under it.
+template <typename T>
+class Guarded {
+ public:
+  // The value, locked as long as this object lives.
+  class Lock {
+   public:
+    T& operator*() const { return value_; }
+    T* operator->() const { return &value_; }
+
+   private:
+    friend class Guarded;
+    explicit Lock(const Guarded& guarded) : held_(guarded.mutex_), value_(guarded.value_) {}
+    std::lock_guard<std::mutex> held_;
+    T& value_;  // owned by the Guarded that made this lock
+  };
+
+  Guarded() = default;
+  explicit Guarded(T value) : value_(std::move(value)) {}
+
+  [[nodiscard]] Lock lock() const { return Lock(*this); }
+  // A copy of the value as it is now.
+  [[nodiscard]] T copy() const { return *lock(); }
+  // Replaces the value. The old one is destroyed after the lock was released.
+  void set(T value) {
+    Lock locked(*this);
+    std::swap(*locked, value);
+  }
+  // Takes the value out and leaves an empty one.
+  [[nodiscard]] T take() {
+    T taken{};
+    Lock locked(*this);
+    std::swap(*locked, taken);
+    return taken;
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  mutable T value_{};
+};
+
+}  // namespace halvox

@@ -1,0 +1,137 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "backends/HVReportingVocabulary.h"
+#include "platform/dispatch.h"
+#include "platform/process.h"
+#include "platform/value.h"
+#include "session/Guarded.h"
+#include "session/MessageHistory.h"
+#include "session/ReplyCallbacks.h"
+#include "session/ResourceAccount.h"
+
+namespace halvox {
+
+// Keys of a message that are offered to clients. Nothing in the service reads them: no field is
+// left out of comparisons and nothing is held back for a time on their account. Their established
+// names begin with "_HV", which C++ keeps for itself; hence the k.
+inline constexpr std::string_view kHVReportingSessionBlacklistFieldsKey =
+    "_comparison_field_blacklist";
+inline constexpr std::string_view kHVReportingSessionThrottleSecondsKey = "_throttle_seconds";
+
+// One reporting session of one client: what it is for, how it is configured, and the messages that
+// it accepted while it was started.
+//
+//   created --start--> started --stop--> stopped --start--> started ...; gone when released
+//
+// The client's connection object drives it on the reporting queue and owns it together with jobs
+// and analytics payloads that still need it; so it is always held by a shared pointer. Every
+// property may be read and written from any thread, one indivisible access at a time. No operation
+// fails.
+class HVReportingSession : public std::enable_shared_from_this<HVReportingSession> {
+ public:
+  using ProcessIdentifiers = std::vector<platform::ProcessID>;
+  // The history, locked: there is one exactly while the session is started.
+  using HistoryLock = Guarded<std::optional<MessageHistory>>::Lock;
+
+  HVReportingSession(ReporterID reporterID, ProcessIdentifiers processIdentifiers);
+  HVReportingSession(const HVReportingSession&) = delete;
+  HVReportingSession& operator=(const HVReportingSession&) = delete;
+  ~HVReportingSession();
+
+  // From now on what the session holds is charged to that account, until the session is gone. At
+  // most once, before anything else is done with the session.
+  void chargeTo(std::shared_ptr<ResourceAccount> account);
+
+  [[nodiscard]] ReporterID reporterID() const { return reporterID_; }
+  // Processes of the owner; the first is reported as the owner.
+  [[nodiscard]] ProcessIdentifiers processIdentifiers() const { return processIdentifiers_.copy(); }
+  void setProcessIdentifiers(ProcessIdentifiers identifiers);
+  // True from start to stop.
+  [[nodiscard]] bool started() const { return started_.load(std::memory_order_acquire); }
+  [[nodiscard]] AudioServiceType serviceType() const;
+  // Sets the service name too.
+  void setServiceType(AudioServiceType serviceType);
+  // Always the name that belongs to the service type.
+  [[nodiscard]] std::string_view serviceName() const;
+  // Whether the session uses the real-time reporting link; false at first.
+  [[nodiscard]] bool tlmReportingEnabled() const;
+  void setTlmReportingEnabled(bool enabled);
+  // The queue of the session's real-time reporting; made at the first call.
+  [[nodiscard]] const std::shared_ptr<platform::DispatchQueue>& tlmReportingQueue();
+  // What the client connection wants to call when the session was stopped. The session only keeps
+  // it; whoever takes it out calls it.
+  [[nodiscard]] BoolReply transactionCompleteBlock() const;
+  void setTransactionCompleteBlock(BoolReply block);
+  [[nodiscard]] BoolReply takeTransactionCompleteBlock();
+
+  // The configuration as it is now, empty if none was set. Every call sees the newest state, and no
+  // later change alters what it returned.
+  [[nodiscard]] platform::Dictionary configuration() const { return configuration_.copy(); }
+  // Adds the entries of a dictionary, new values in the place of old ones; none changes nothing. No
+  // key is ever removed.
+  void setConfiguration(const platform::Message& configuration);
+  void updateConfigurationWithContentsOfConfiguration(const platform::Dictionary& configuration);
+
+  // "reporterID=7,serviceName=haptics,ownerPid=12,HostApplicationDisplayID=Unknown,started=0"
+  [[nodiscard]] std::string description() const;
+  void appendDescription(std::string& text) const;
+  [[nodiscard]] bool shouldReportOrientation() const { return false; }
+
+  // Begins a run with an empty history; does nothing to a started session. Never blocks.
+  void start();
+  // Ends the run and forgets its history; does nothing to a session that is not started.
+  void stop();
+
+  // Records a message in the history unless it repeats the one before it of its category and type.
+  // `sync` is accepted and has no effect. The reply, when there is one, is called with none before
+  // this returns.
+  void sendMessage(const platform::Message& message, AudioEventCategory category,
+                   AudioEventType type, bool sync, const ErrorReply& reply);
+  void sendMessage(const platform::Message& message, AudioEventCategory category,
+                   AudioEventType type, const ErrorReply& reply);
+  // Sends one message outside any session, one second later, on a background queue; there the
+  // reply, when there is one, is called. `userInfo` is accepted and not used.
+  static void sendSingleMessage(const platform::Message& message, AudioEventCategory category,
+                                AudioEventType type, AudioServiceType serviceType,
+                                const platform::Dictionary& userInfo, const ErrorReply& reply);
+
+  // The message history of the current run, and the lock of all bookkeeping of identifiers.
+  [[nodiscard]] HistoryLock nestedAggregatedPayloadData() const { return history_.lock(); }
+  // Gives a message its identifier and records it, or drops it as redundant: then true. The caller
+  // holds the history, which may be none: then nothing is recorded and the answer is false.
+  bool createMessageIdentifierWithCategory(const HistoryLock& history, AudioEventCategory category,
+                                           AudioEventType type,
+                                           const platform::Dictionary& message);
+
+ private:
+  void charge(std::size_t before, std::size_t after);
+  void record(AudioEventCategory category, AudioEventType type,
+              const platform::Dictionary& message);
+  void submitAsSingleMessage(const platform::Dictionary& message, AudioEventCategory category,
+                             AudioEventType type);
+
+  const ReporterID reporterID_;
+  std::shared_ptr<ResourceAccount> account_;  // null: nobody is charged
+  std::atomic<std::size_t> chargedBytes_{0};  // orders with nothing: the sum of what was charged
+  Guarded<ProcessIdentifiers> processIdentifiers_;
+  Guarded<platform::Dictionary> configuration_;
+  Guarded<std::optional<MessageHistory>> history_;
+  Guarded<BoolReply> transactionCompleteBlock_;
+  std::once_flag tlmReportingQueueMade_;
+  std::shared_ptr<platform::DispatchQueue> tlmReportingQueue_;
+  // Single values; a reader on another thread that sees one a little late is no harm.
+  std::atomic<AudioServiceType> serviceType_{AudioServiceType::kUnknown};
+  std::atomic<bool> tlmReportingEnabled_{false};
+  std::atomic<bool> started_{false};  // released by start and stop after the history is in place
+};
+
+}  // namespace halvox

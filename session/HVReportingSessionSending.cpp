@@ -1,0 +1,104 @@
+#include <utility>
+
+#include "backends/HVReportingUtility.h"
+#include "platform/services.h"
+#include "platform/statistics.h"
+#include "session/HVReportingSession.h"
+#include "session/SessionLog.h"
+#include "session/TracePoints.h"
+
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+
+// received = recorded + suppressed + not recorded.
+struct MessageCounters {
+  platform::Counter& received;
+  platform::Counter& recorded;
+  platform::Counter& redundant;
+  platform::Counter& notStarted;
+};
+
+const MessageCounters& counters() {
+  constexpr std::string_view kPiece = "session";
+  platform::StatisticsService& statistics = platform::statistics();
+  static const MessageCounters made{statistics.counter(kPiece, "received"),
+                                    statistics.counter(kPiece, "recorded"),
+                                    statistics.counter(kPiece, "suppressed: redundant"),
+                                    statistics.counter(kPiece, "not recorded: not started")};
+  return made;
+}
+
+// Errors are never suppressed, however often they repeat. The category is compared as a whole: an
+// error category with a domain is not exempt.
+bool isExemptFromSuppression(AudioEventCategory category, AudioEventType type) {
+  return category == AudioEventCategory::kError || type == AudioEventType::kError;
+}
+
+}  // namespace
+
+void HVReportingSession::sendMessage(const platform::Message& message, AudioEventCategory category,
+                                     AudioEventType type, const ErrorReply& reply) {
+  sendMessage(message, category, type, false, reply);
+}
+
+void HVReportingSession::sendMessage(const platform::Message& message, AudioEventCategory category,
+                                     AudioEventType type, bool /*sync*/, const ErrorReply& reply) {
+  kSessionLog.debug("sending message for session owned by ", number(reporterID_));
+  const Dictionary tagged = HVReportingUtilityAddAudioMessageTag(
+      HVReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(Dictionary())), category, type);
+  record(category, type, tagged);
+  emitTracePoint(ReportingTracePoint::kMessageSent);
+  const bool wasStarted = started();
+  if (tlmReportingEnabled() && !wasStarted) submitAsSingleMessage(tagged, category, type);
+  if (reply) reply(std::nullopt);
+}
+
+void HVReportingSession::record(AudioEventCategory category, AudioEventType type,
+                                const Dictionary& message) {
+  counters().received.add();
+  const HistoryLock history = history_.lock();
+  const bool redundant = createMessageIdentifierWithCategory(history, category, type, message);
+  if (redundant) {
+    counters().redundant.add();
+  } else {
+    (history->has_value() ? counters().recorded : counters().notStarted).add();
+  }
+}
+
+bool HVReportingSession::createMessageIdentifierWithCategory(const HistoryLock& history,
+                                                             AudioEventCategory category,
+                                                             AudioEventType type,
+                                                             const Dictionary& message) {
+  if (!history->has_value()) return false;
+  MessageHistory& messages = **history;
+  MessageHistory::Base& base = messages.base(category, type);
+  const Dictionary* previous = messages.newestMessage(base);
+  if (previous != nullptr && !isExemptFromSuppression(category, type) &&
+      equalApartFromVolatileKeys(*previous, message)) {
+    kSessionLog.debug("dropping redundant event");
+    return true;
+  }
+  const std::size_t before = messages.memorySize();
+  messages.append(base, message);
+  charge(before, messages.memorySize());
+  return false;
+}
+
+void HVReportingSession::submitAsSingleMessage(const Dictionary& message,
+                                               AudioEventCategory category, AudioEventType type) {
+  // The job holds the session: the message belongs to it, and its type and configuration count as
+  // they are when the job runs.
+  tlmReportingQueue()->async(
+      platform::JobWeight::kBrief, [session = shared_from_this(), message, category, type] {
+        kSessionLog.debug(
+            "entering tlmreporting "
+            "-[HVReportingSession sendMessage:category:type:sync:reply:]_block_invoke");
+        kSessionLog.debug("session not started, will send as a single message");
+        sendSingleMessage(message, category, type, session->serviceType(), session->configuration(),
+                          nullptr);
+      });
+}
+
+}  // namespace halvox
