@@ -11,7 +11,8 @@
 //
 // Each returns false and leaves `out` as it was when what it is given has no form on the wire: a
 // value that does not fit its signature, text that is not UTF-8 or has a NUL in it, a name or path
-// that is not valid, a serial of 0, nesting past kMaxNesting, an array or message over the wire's
+// that is not valid, a serial of 0, nesting of more than kMaxNesting containers (where the entries
+// of a dictionary count too, as some readers count them), an array or message over the wire's
 // limits. Their allocation is that of `out` growing.
 namespace halvox::platform::linux_::dbus {
 

@@ -69,12 +69,13 @@ class ServerHandshake {
   void onLine(std::string_view line, std::string& output);
   void onAuth(std::string_view arguments, std::string& output);
   void onIdentity(std::string_view hex, std::string& output);
+  void onCancel(std::string_view command, std::string& output);
   void accept(std::string& output);
   void reject(std::string& output);
   void refuse(std::string_view reason, std::string& output);
   void countRefusal();
   void fail(std::string error);
-  [[nodiscard]] HandshakeProgress progress(std::size_t consumedBytes) const;
+  [[nodiscard]] bool isOver() const;
 
   std::string guidHex_;
   std::string peerUid_;

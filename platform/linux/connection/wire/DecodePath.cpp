@@ -1,0 +1,67 @@
+#include "platform/linux/connection/wire/DecodePath.h"
+
+#include <array>
+#include <cstdio>
+
+#include "platform/linux/connection/wire/Utf8.h"
+
+namespace halvox::platform::linux_::dbus {
+namespace {
+
+// Enough to recognise a key by; a path has up to 64 of them.
+constexpr std::size_t kMaxQuotedBytes = 64;
+
+bool isContinuation(char byte) { return (static_cast<unsigned char>(byte) & 0xc0) == 0x80; }
+
+// The start of a text, without half a character at its end.
+std::string_view startOf(std::string_view text) {
+  if (text.size() <= kMaxQuotedBytes) return text;
+  std::size_t length = kMaxQuotedBytes;
+  while (length > 0 && isContinuation(text[length])) --length;
+  return text.substr(0, length);
+}
+
+void appendEscaped(std::string& out, char byte) {
+  std::array<char, 5> escaped{};
+  std::snprintf(escaped.data(), escaped.size(), "\\x%02x",
+                static_cast<unsigned>(static_cast<unsigned char>(byte)));
+  out += escaped.data();
+}
+
+}  // namespace
+
+std::string quotable(std::string_view text) {
+  const std::string_view start = startOf(text);
+  const bool isUtf8 = isWireText(start);
+  std::string out;
+  for (const char byte : start) {
+    const auto code = static_cast<unsigned char>(byte);
+    if (code < 0x20 || code == 0x7f || (code >= 0x80 && !isUtf8)) {
+      appendEscaped(out, byte);
+    } else {
+      if (byte == '"' || byte == '\\') out += '\\';
+      out += byte;
+    }
+  }
+  if (start.size() < text.size()) out += "...";
+  return out;
+}
+
+void DecodePath::putBefore(std::string_view key) {
+  const bool isLast = steps_.empty() || steps_.front() == '[';
+  steps_ = '"' + quotable(key) + '"' + (isLast ? "" : ".") + steps_;
+}
+
+void DecodePath::putBefore(std::size_t element) {
+  const bool isLast = steps_.empty() || steps_.front() == '[';
+  steps_ = '[' + std::to_string(element) + ']' + (isLast ? "" : ".") + steps_;
+}
+
+std::string DecodePath::text() const {
+  if (argument_ == 0) return {};
+  std::string text = "argument " + std::to_string(argument_);
+  if (!steps_.empty()) text += steps_.front() == '[' ? ", element " : ", key ";
+  return text + steps_;
+}
+
+}  // namespace halvox::platform::linux_::dbus

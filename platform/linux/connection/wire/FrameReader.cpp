@@ -1,0 +1,240 @@
+#include <array>
+#include <cstring>
+
+#include "platform/linux/connection/wire/Frame.h"
+#include "platform/linux/connection/wire/HeaderFields.h"
+#include "platform/linux/connection/wire/Names.h"
+#include "platform/linux/connection/wire/Signature.h"
+#include "platform/linux/connection/wire/ValueSkipper.h"
+#include "platform/linux/connection/wire/WireReader.h"
+
+namespace halvox::platform::linux_::dbus {
+namespace {
+
+struct FieldRule {
+  std::string_view name;
+  char type;
+};
+constexpr std::array<FieldRule, 10> kFieldRules{{{"", '\0'},
+                                                 {"path", 'o'},
+                                                 {"interface", 's'},
+                                                 {"member", 's'},
+                                                 {"error name", 's'},
+                                                 {"reply serial", 'u'},
+                                                 {"destination", 's'},
+                                                 {"sender", 's'},
+                                                 {"signature", 'g'},
+                                                 {"number of file descriptors", 'u'}}};
+
+constexpr unsigned fieldBit(HeaderField field) { return 1U << static_cast<unsigned>(field); }
+
+// Programs talk to themselves by these; they are never sent.
+constexpr std::string_view kLocalPath = "/org/freedesktop/DBus/Local";
+constexpr std::string_view kLocalInterface = "org.freedesktop.DBus.Local";
+
+std::uint8_t byteAt(std::span<const std::byte> bytes, std::size_t offset) {
+  return std::to_integer<std::uint8_t>(bytes[offset]);
+}
+
+std::uint32_t numberAt(std::span<const std::byte> bytes, std::size_t offset, bool bigEndian) {
+  std::uint32_t number = 0;
+  WireReader reader(bytes.subspan(offset, sizeof number), bigEndian);
+  (void)reader.read(number);
+  return number;
+}
+
+// The text of the problem with the bytes that every frame starts with; empty when there is none.
+std::string_view problemOfStart(std::span<const std::byte> bytes, std::size_t& offset) {
+  offset = 0;
+  if (!bytes.empty() && byteAt(bytes, 0) != 'l' && byteAt(bytes, 0) != 'B') {
+    return "the byte order is neither 'l' nor 'B'";
+  }
+  offset = kTypeOffset;
+  if (bytes.size() > kTypeOffset && byteAt(bytes, kTypeOffset) == 0) {
+    return "the message type is 0";
+  }
+  offset = kVersionOffset;
+  if (bytes.size() > kVersionOffset && byteAt(bytes, kVersionOffset) != kProtocolVersion) {
+    return "the protocol version is not 1";
+  }
+  return {};
+}
+
+std::uint64_t roundedUp(std::uint64_t bytes) { return (bytes + 7) & ~std::uint64_t{7}; }
+
+FrameMeasure broken(std::string message, std::size_t offset) {
+  return {FrameMeasure::State::kBroken, 0, {std::move(message), offset}};
+}
+
+// Reads the array of header fields into a header.
+class FieldReader {
+ public:
+  FieldReader(std::span<const std::byte> fields, bool bigEndian, MessageHeader& header)
+      : reader_(fields, bigEndian), header_(header) {}
+
+  // False when something is wrong; error() says what.
+  bool readAll() {
+    while (!reader_.atLimit()) {
+      if (!readField()) return false;
+    }
+    return checkRequired();
+  }
+
+  [[nodiscard]] WireError error() const {
+    std::string message = "header field ";
+    message += std::to_string(code_);
+    if (code_ > 0 && code_ < kFieldRules.size()) {
+      message.append(" (").append(kFieldRules[code_].name).append(")");
+    }
+    message.append(": ").append(reader_.problem());
+    return {std::move(message), kFrameStartBytes + reader_.position()};
+  }
+
+ private:
+  bool readField() {
+    std::string_view type;
+    if (!reader_.align(8) || !reader_.read(code_) || !reader_.readVariantSignature(type)) {
+      return false;
+    }
+    if (code_ == 0) return reader_.fail("no field has this number");
+    if (code_ >= kFieldRules.size()) return skipUnknown(type);
+    if (type.size() != 1 || type.front() != kFieldRules[code_].type) {
+      return reader_.fail("not of the type that it must have");
+    }
+    const unsigned bit = 1U << code_;
+    if ((seen_ & bit) != 0) return reader_.fail("comes twice");
+    seen_ |= bit;
+    return readKnown(static_cast<HeaderField>(code_));
+  }
+
+  bool skipUnknown(std::string_view type) {
+    const SignatureShape shape = shapeOfType(type);
+    if (shape == SignatureShape::kBroken || shape == SignatureShape::kTooDeep) {
+      return reader_.fail("its signature is not valid");
+    }
+    return skipValue(reader_, type);
+  }
+
+  bool readKnown(HeaderField field) {
+    switch (field) {
+      case HeaderField::kPath:
+        return reader_.readPath(header_.path) &&
+               (header_.path != kLocalPath || reader_.fail("a path that is never sent"));
+      case HeaderField::kInterface:
+        return readName(header_.interface, isInterfaceName) &&
+               (header_.interface != kLocalInterface ||
+                reader_.fail("an interface that is never sent"));
+      case HeaderField::kMember:
+        return readName(header_.member, isMemberName);
+      case HeaderField::kErrorName:
+        return readName(header_.errorName, isInterfaceName);
+      case HeaderField::kReplySerial:
+        return reader_.read(header_.replySerial) &&
+               (header_.replySerial != 0 || reader_.fail("it is 0"));
+      case HeaderField::kDestination:
+        return readName(header_.destination, isBusName);
+      case HeaderField::kSender:
+        return readName(header_.sender, isBusName);
+      case HeaderField::kSignature:
+        return reader_.readSignature(header_.signature);
+      case HeaderField::kUnixFds:
+        return reader_.read(header_.unixFds);
+    }
+    return false;
+  }
+
+  // Names are of a few ASCII characters, so their rules make a check of the text unnecessary.
+  bool readName(std::string_view& name, bool (*isValid)(std::string_view)) {
+    return reader_.readUncheckedText(name) && (isValid(name) || reader_.fail("not a valid name"));
+  }
+
+  bool checkRequired() {
+    const unsigned missing = requiredFields() & ~seen_;
+    if (missing == 0) return true;
+    code_ = static_cast<std::uint8_t>(__builtin_ctz(missing));
+    return reader_.fail("missing from a message of this type");
+  }
+
+  [[nodiscard]] unsigned requiredFields() const {
+    switch (header_.type) {
+      case MessageType::kMethodCall:
+        return fieldBit(HeaderField::kPath) | fieldBit(HeaderField::kMember);
+      case MessageType::kMethodReturn:
+        return fieldBit(HeaderField::kReplySerial);
+      case MessageType::kError:
+        return fieldBit(HeaderField::kReplySerial) | fieldBit(HeaderField::kErrorName);
+      case MessageType::kSignal:
+        return fieldBit(HeaderField::kPath) | fieldBit(HeaderField::kInterface) |
+               fieldBit(HeaderField::kMember);
+    }
+    return 0;  // an unknown type
+  }
+
+  WireReader reader_;
+  MessageHeader& header_;  // of the caller, who outlives this
+  std::uint8_t code_ = 0;
+  unsigned seen_ = 0;  // a bit for each known field
+};
+
+// What is behind the fields: padding and the body.
+std::variant<Frame, WireError> finish(MessageHeader header, std::span<const std::byte> frame,
+                                      std::size_t fieldsEnd) {
+  const std::size_t bodyStart = roundedUp(fieldsEnd);
+  for (std::size_t offset = fieldsEnd; offset < bodyStart; ++offset) {
+    if (byteAt(frame, offset) != 0) {
+      return WireError{"the padding behind the header is not zero", offset};
+    }
+  }
+  const std::span<const std::byte> body = frame.subspan(bodyStart);
+  if (header.signature.empty() && !body.empty()) {
+    return WireError{"there is a body but no signature", bodyStart};
+  }
+  return Frame{header, body};
+}
+
+}  // namespace
+
+FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrameBytes) {
+  std::size_t offset = 0;
+  const std::string_view problem = problemOfStart(bytes, offset);
+  if (!problem.empty()) return broken(std::string(problem), offset);
+  if (bytes.size() < kFrameStartBytes) return {};
+
+  const bool bigEndian = byteAt(bytes, 0) == 'B';
+  const std::uint64_t bodyBytes = numberAt(bytes, kBodyLengthOffset, bigEndian);
+  const std::uint64_t fieldsBytes = numberAt(bytes, kFieldsLengthOffset, bigEndian);
+  if (fieldsBytes > kMaxArrayBytes) {
+    return broken("the header has more than 64 MiB of fields", kFieldsLengthOffset);
+  }
+  const std::uint64_t total = roundedUp(kFrameStartBytes + fieldsBytes) + bodyBytes;
+  if (total > kMaxMessageBytes) {
+    return broken("a message of more than 128 MiB", kBodyLengthOffset);
+  }
+  if (total > maxFrameBytes) {
+    return broken("a message of " + std::to_string(total) + " bytes, where " +
+                      std::to_string(maxFrameBytes) + " are the limit",
+                  kBodyLengthOffset);
+  }
+  return {FrameMeasure::State::kKnown, static_cast<std::size_t>(total), {}};
+}
+
+std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame) {
+  const FrameMeasure measure = measureFrame(frame, kMaxMessageBytes);
+  if (measure.state == FrameMeasure::State::kBroken) return measure.error;
+  if (measure.totalBytes != frame.size()) {
+    return WireError{"not the size that the header tells", frame.size()};
+  }
+  MessageHeader header;
+  header.type = static_cast<MessageType>(byteAt(frame, kTypeOffset));
+  header.flags = byteAt(frame, kFlagsOffset);
+  header.bigEndian = byteAt(frame, 0) == 'B';
+  header.serial = numberAt(frame, kSerialOffset, header.bigEndian);
+  if (header.serial == 0) return WireError{"the serial number is 0", kSerialOffset};
+
+  const std::size_t fieldsBytes = numberAt(frame, kFieldsLengthOffset, header.bigEndian);
+  FieldReader fields(frame.subspan(kFrameStartBytes, fieldsBytes), header.bigEndian, header);
+  if (!fields.readAll()) return fields.error();
+  return finish(header, frame, kFrameStartBytes + fieldsBytes);
+}
+
+}  // namespace halvox::platform::linux_::dbus

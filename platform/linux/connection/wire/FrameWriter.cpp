@@ -1,0 +1,210 @@
+#include "platform/linux/connection/wire/FrameWriter.h"
+
+#include <array>
+
+#include "platform/linux/connection/wire/Frame.h"
+#include "platform/linux/connection/wire/HeaderFields.h"
+#include "platform/linux/connection/wire/Names.h"
+#include "platform/linux/connection/wire/ValueEncoder.h"
+
+namespace halvox::platform::linux_::dbus {
+namespace {
+
+// Appends one frame: its header field by field, then the body. Takes everything back again unless
+// it was finished well. The buffer is the caller's and outlives this.
+class FrameBuilder {
+ public:
+  FrameBuilder(std::string& out, MessageType type, std::uint8_t flags, std::uint32_t serial)
+      : out_(out), start_(out.size()), encoder_(out, start_) {
+    const std::array<char, 4> first{'l', static_cast<char>(type), static_cast<char>(flags),
+                                    kProtocolVersion};
+    out_.append(first.data(), first.size());
+    encoder_.appendNumber(std::uint32_t{0});
+    encoder_.appendNumber(serial);
+    encoder_.appendNumber(std::uint32_t{0});
+  }
+  FrameBuilder(const FrameBuilder&) = delete;
+  FrameBuilder& operator=(const FrameBuilder&) = delete;
+  ~FrameBuilder() {
+    if (!finished_) out_.resize(start_);
+  }
+
+  void addNumber(HeaderField field, std::uint32_t number) {
+    beginField(field, "u");
+    encoder_.appendNumber(number);
+  }
+  void addPath(std::string_view path) {
+    beginField(HeaderField::kPath, "o");
+    encoder_.appendText(path);
+  }
+  void addText(HeaderField field, std::string_view text) {
+    if (text.empty()) return;
+    beginField(field, "s");
+    encoder_.appendText(text);
+  }
+
+  // Adds the last field, ends the header and appends the body.
+  bool finish(std::string_view signature, std::span<const Value> values) {
+    if (!signature.empty()) {
+      beginField(HeaderField::kSignature, "g");
+      encoder_.appendSignature(signature);
+    }
+    encoder_.replaceLength(start_ + kFieldsLengthOffset, out_.size() - start_ - kFrameStartBytes);
+    encoder_.align(8);
+    const std::size_t bodyStart = out_.size();
+    if (!encoder_.appendAll(signature, values)) return false;
+    encoder_.replaceLength(start_ + kBodyLengthOffset, out_.size() - bodyStart);
+    finished_ = out_.size() - start_ <= kMaxMessageBytes;
+    return finished_;
+  }
+
+ private:
+  void beginField(HeaderField field, std::string_view type) {
+    encoder_.align(8);
+    encoder_.appendNumber(static_cast<std::uint8_t>(field));
+    encoder_.appendSignature(type);
+  }
+
+  std::string& out_;
+  std::size_t start_;
+  ValueEncoder encoder_;
+  bool finished_ = false;
+};
+
+bool isValid(const ReplyTo& replyTo, std::uint32_t serial) {
+  return serial != 0 && replyTo.serial != 0 &&
+         (replyTo.destination.empty() || isBusName(replyTo.destination));
+}
+
+bool isValid(const CallTarget& target, std::uint32_t serial) {
+  return serial != 0 && (target.destination.empty() || isBusName(target.destination)) &&
+         (target.interface.empty() || isInterfaceName(target.interface)) &&
+         isObjectPath(target.path) && isMemberName(target.member);
+}
+
+// Nearly all replies have no value or a boolean and go to a peer without a name. Their frames are
+// the same but for three numbers.
+constexpr std::size_t kPlainReplyBytes = 24;
+constexpr std::size_t kBooleanReplyBytes = 36;
+constexpr std::array<char, kBooleanReplyBytes> kPlainReply{'l',
+                                                           2,
+                                                           kNoReplyExpected,
+                                                           kProtocolVersion,  // fixed part; no body
+                                                           0,
+                                                           0,
+                                                           0,
+                                                           0,  //
+                                                           0,
+                                                           0,
+                                                           0,
+                                                           0,  // serial
+                                                           8,
+                                                           0,
+                                                           0,
+                                                           0,  // bytes of fields
+                                                           5,
+                                                           1,
+                                                           'u',
+                                                           0,  // reply serial
+                                                           0,
+                                                           0,
+                                                           0,
+                                                           0};
+constexpr std::array<char, kBooleanReplyBytes> kBooleanReply{
+    'l',
+    2,
+    kNoReplyExpected,
+    kProtocolVersion,  // fixed part; a body of 4 bytes
+    4,
+    0,
+    0,
+    0,  //
+    0,
+    0,
+    0,
+    0,  // serial
+    15,
+    0,
+    0,
+    0,  // bytes of fields
+    5,
+    1,
+    'u',
+    0,  // reply serial
+    0,
+    0,
+    0,
+    0,  //
+    8,
+    1,
+    'g',
+    0,  // signature, and a byte of padding
+    1,
+    'b',
+    0,
+    0,  //
+    0,
+    0,
+    0,
+    0};
+constexpr std::size_t kReplySerialOffset = 20;
+constexpr std::size_t kBooleanOffset = 32;
+
+void appendPlainReply(std::string& out, std::uint32_t replySerial, std::uint32_t serial) {
+  const std::size_t start = out.size();
+  out.append(kPlainReply.data(), kPlainReplyBytes);
+  putLittleEndian(&out[start + kSerialOffset], serial);
+  putLittleEndian(&out[start + kReplySerialOffset], replySerial);
+}
+
+void appendBooleanReply(std::string& out, std::uint32_t replySerial, std::uint32_t serial,
+                        bool value) {
+  const std::size_t start = out.size();
+  out.append(kBooleanReply.data(), kBooleanReplyBytes);
+  putLittleEndian(&out[start + kSerialOffset], serial);
+  putLittleEndian(&out[start + kReplySerialOffset], replySerial);
+  out[start + kBooleanOffset] = value ? 1 : 0;
+}
+
+}  // namespace
+
+bool appendMethodReturn(std::string& out, const ReplyTo& replyTo, std::uint32_t serial,
+                        std::string_view signature, const Value& value) {
+  if (!isValid(replyTo, serial)) return false;
+  if (replyTo.destination.empty() && signature.empty()) {
+    appendPlainReply(out, replyTo.serial, serial);
+    return true;
+  }
+  if (replyTo.destination.empty() && signature == "b" && value.isNumber()) {
+    appendBooleanReply(out, replyTo.serial, serial, value.toBool());
+    return true;
+  }
+  FrameBuilder frame(out, MessageType::kMethodReturn, kNoReplyExpected, serial);
+  frame.addNumber(HeaderField::kReplySerial, replyTo.serial);
+  frame.addText(HeaderField::kDestination, replyTo.destination);
+  return frame.finish(signature, std::span(&value, signature.empty() ? 0 : 1));
+}
+
+bool appendError(std::string& out, const ReplyTo& replyTo, std::uint32_t serial,
+                 std::string_view errorName, std::string_view message) {
+  if (!isValid(replyTo, serial) || !isInterfaceName(errorName)) return false;
+  FrameBuilder frame(out, MessageType::kError, kNoReplyExpected, serial);
+  frame.addText(HeaderField::kErrorName, errorName);
+  frame.addNumber(HeaderField::kReplySerial, replyTo.serial);
+  frame.addText(HeaderField::kDestination, replyTo.destination);
+  const Value text(message);
+  return frame.finish("s", std::span(&text, 1));
+}
+
+bool appendMethodCall(std::string& out, std::uint32_t serial, const CallTarget& target,
+                      std::string_view signature, std::span<const Value> arguments) {
+  if (!isValid(target, serial)) return false;
+  FrameBuilder frame(out, MessageType::kMethodCall, 0, serial);
+  frame.addPath(target.path);
+  frame.addText(HeaderField::kInterface, target.interface);
+  frame.addText(HeaderField::kMember, target.member);
+  frame.addText(HeaderField::kDestination, target.destination);
+  return frame.finish(signature, arguments);
+}
+
+}  // namespace halvox::platform::linux_::dbus

@@ -1,0 +1,124 @@
+#include "platform/linux/connection/wire/Signature.h"
+
+namespace halvox::platform::linux_::dbus {
+namespace {
+
+bool isBasic(char code) {
+  return std::string_view("ybnqiuxtdsogh").find(code) != std::string_view::npos;
+}
+
+// Walks over complete types and notes on the way what keeps them from being taken. Recursion is
+// bounded by the length of a signature.
+class TypeScanner {
+ public:
+  explicit TypeScanner(std::string_view text) : text_(text) {}
+
+  [[nodiscard]] bool atEnd() const { return position_ == text_.size(); }
+
+  // False when no complete type starts here.
+  bool scanType(unsigned arrays, unsigned structs) {
+    if (arrays > kMaxSignatureNesting || structs > kMaxSignatureNesting) tooDeep_ = true;
+    const char code = next();
+    if (code == 'a') {
+      return peek() == '{' ? scanEntry(arrays + 1, structs + 1) : scanType(arrays + 1, structs);
+    }
+    if (code == '(') return scanStruct(arrays, structs + 1);
+    if (code == 'h') unsupported_ = true;
+    return code == 'v' || isBasic(code);
+  }
+
+  [[nodiscard]] SignatureShape shape() const {
+    if (tooDeep_) return SignatureShape::kTooDeep;
+    return unsupported_ ? SignatureShape::kUnsupported : SignatureShape::kTaken;
+  }
+
+ private:
+  [[nodiscard]] char peek() const { return atEnd() ? '\0' : text_[position_]; }
+  char next() {
+    const char code = peek();
+    if (!atEnd()) ++position_;
+    return code;
+  }
+
+  bool scanEntry(unsigned arrays, unsigned structs) {
+    ++position_;
+    const char key = next();
+    if (key != 's') unsupported_ = true;
+    return isBasic(key) && scanType(arrays, structs) && next() == '}';
+  }
+
+  // A date is the one struct that is taken.
+  bool scanStruct(unsigned arrays, unsigned structs) {
+    if (text_.substr(position_, 2) != "d)") unsupported_ = true;
+    do {
+      if (!scanType(arrays, structs)) return false;
+    } while (!atEnd() && peek() != ')');
+    return next() == ')';
+  }
+
+  std::string_view text_;  // of the caller, who outlives this
+  std::size_t position_ = 0;
+  bool tooDeep_ = false;
+  bool unsupported_ = false;
+};
+
+}  // namespace
+
+SignatureShape shapeOfSignature(std::string_view signature) {
+  if (signature.size() > kMaxSignatureBytes) return SignatureShape::kBroken;
+  TypeScanner scanner(signature);
+  while (!scanner.atEnd()) {
+    if (!scanner.scanType(0, 0)) return SignatureShape::kBroken;
+  }
+  return scanner.shape();
+}
+
+SignatureShape shapeOfType(std::string_view type) {
+  if (type.size() > kMaxSignatureBytes) return SignatureShape::kBroken;
+  TypeScanner scanner(type);
+  if (!scanner.scanType(0, 0) || !scanner.atEnd()) return SignatureShape::kBroken;
+  return scanner.shape();
+}
+
+bool isSignature(std::string_view signature) {
+  const SignatureShape shape = shapeOfSignature(signature);
+  return shape == SignatureShape::kTaken || shape == SignatureShape::kUnsupported;
+}
+
+std::size_t firstTypeLength(std::string_view signature) {
+  std::size_t length = 0;
+  while (signature[length] == 'a') ++length;
+  unsigned open = 0;
+  do {
+    const char code = signature[length++];
+    if (code == '(' || code == '{') ++open;
+    if (code == ')' || code == '}') --open;
+  } while (open > 0);
+  return length;
+}
+
+std::size_t alignmentOf(char typeCode) {
+  switch (typeCode) {
+    case 'n':
+    case 'q':
+      return 2;
+    case 'b':
+    case 'i':
+    case 'u':
+    case 's':
+    case 'o':
+    case 'a':
+    case 'h':
+      return 4;
+    case 'x':
+    case 't':
+    case 'd':
+    case '(':
+    case '{':
+      return 8;
+    default:  // y, g, v, and what is no type
+      return 1;
+  }
+}
+
+}  // namespace halvox::platform::linux_::dbus

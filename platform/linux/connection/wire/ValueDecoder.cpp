@@ -1,0 +1,278 @@
+#include "platform/linux/connection/wire/ValueDecoder.h"
+
+#include <span>
+
+#include "platform/linux/connection/wire/DecodePath.h"
+#include "platform/linux/connection/wire/Signature.h"
+#include "platform/linux/connection/wire/WireReader.h"
+
+namespace halvox::platform::linux_::dbus {
+namespace {
+
+using Kind = DecodeError::Kind;
+
+// More than messages have in all containers that are open at a time; past it the memory that a
+// large message needed is given back.
+constexpr std::size_t kKeptElements = 1024;
+
+// The elements of containers that are not complete yet, innermost last. A thread keeps one, so that
+// containers can be made in their final size without an allocation besides.
+struct Scratch {
+  std::vector<Value> values;
+  std::vector<Dictionary::Entry> entries;
+
+  void clear() {
+    values.clear();
+    entries.clear();
+    if (values.capacity() > kKeptElements) values.shrink_to_fit();
+    if (entries.capacity() > kKeptElements) entries.shrink_to_fit();
+  }
+};
+
+Scratch& scratchOfThread() {
+  static thread_local Scratch scratch;
+  return scratch;
+}
+
+// Decodes the values of one body. Types that it is given are sound and complete, as the signature
+// of a frame and those of variants are checked before they are used; level is the number of
+// containers around a value.
+class Decoder {
+ public:
+  Decoder(const Frame& frame, Scratch& scratch)
+      : reader_(frame.body, frame.header.bigEndian), scratch_(scratch) {}
+
+  bool decodeArguments(std::string_view types, std::vector<Value>& arguments);
+  [[nodiscard]] DecodeError error() const;
+
+ private:
+  bool decode(std::string_view type, unsigned level, Value& value);
+  bool decodeContainer(std::string_view type, unsigned level, Value& value);
+  bool decodeDate(std::string_view type, Value& value);
+  bool decodeVariant(unsigned level, Value& value);
+  bool decodeData(Value& value);
+  bool decodeArray(std::string_view type, unsigned level, Value& value);
+  bool decodeDictionary(std::string_view type, unsigned level, Value& value);
+  bool decodeEntry(std::string_view type, unsigned level);
+
+  template <typename Number>
+  bool decodeNumber(std::string_view type, Value& value) {
+    Number number{};
+    if (!reader_.read(number)) return malformed(type);
+    value = Value(number);
+    return true;
+  }
+  template <typename Read>
+  bool decodeText(std::string_view type, Read read, Value& value) {
+    std::string_view text;
+    if (!(reader_.*read)(text)) return malformed(type);
+    value = Value(text);
+    return true;
+  }
+
+  bool refuse(Kind kind, std::string_view problem, std::string_view signature) {
+    kind_ = kind;
+    problem_ = problem;
+    signature_ = signature;
+    return false;
+  }
+  bool malformed(std::string_view signature) {
+    return refuse(Kind::kMalformed, reader_.problem(), signature);
+  }
+
+  WireReader reader_;
+  Scratch& scratch_;  // of the thread
+  // What went wrong, and on the way out of the containers, where.
+  Kind kind_ = Kind::kMalformed;
+  std::string_view problem_;
+  std::string_view signature_;
+  DecodePath path_;
+};
+
+bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& arguments) {
+  for (std::string_view rest = types; !rest.empty();) {
+    const std::string_view type = rest.substr(0, firstTypeLength(rest));
+    if (!decode(type, 0, arguments.emplace_back())) {
+      path_.setArgument(arguments.size());
+      return false;
+    }
+    rest.remove_prefix(type.size());
+  }
+  return reader_.atLimit() ||
+         refuse(Kind::kMalformed, "there are bytes behind the last argument", types);
+}
+
+bool Decoder::decode(std::string_view type, unsigned level, Value& value) {
+  switch (type.front()) {
+    case 'y':
+      return decodeNumber<std::uint8_t>(type, value);
+    case 'n':
+      return decodeNumber<std::int16_t>(type, value);
+    case 'q':
+      return decodeNumber<std::uint16_t>(type, value);
+    case 'i':
+      return decodeNumber<std::int32_t>(type, value);
+    case 'u':
+      return decodeNumber<std::uint32_t>(type, value);
+    case 'x':
+      return decodeNumber<std::int64_t>(type, value);
+    case 't':
+      return decodeNumber<std::uint64_t>(type, value);
+    case 'd':
+      return decodeNumber<double>(type, value);
+    case 'b': {
+      bool boolean = false;
+      if (!reader_.readBoolean(boolean)) return malformed(type);
+      value = Value(boolean);
+      return true;
+    }
+    case 's':
+      return decodeText(type, &WireReader::readText, value);
+    case 'o':
+      return decodeText(type, &WireReader::readPath, value);
+    case 'g':
+      return decodeText(type, &WireReader::readSignature, value);
+    default:
+      return decodeContainer(type, level + 1, value);
+  }
+}
+
+bool Decoder::decodeContainer(std::string_view type, unsigned level, Value& value) {
+  if (level > kMaxNesting) {
+    return refuse(Kind::kUnsupported, "nesting of more than 64 levels is not taken", type);
+  }
+  if (type.front() == 'v') return decodeVariant(level, value);
+  if (type == "ay") return decodeData(value);
+  if (type.starts_with("a{s")) return decodeDictionary(type, level, value);
+  if (type.front() == 'a' && type[1] != '{') return decodeArray(type, level, value);
+  if (type == "(d)") return decodeDate(type, value);
+  return refuse(Kind::kUnsupported, "values of this signature are not taken", type);
+}
+
+bool Decoder::decodeDate(std::string_view type, Value& value) {
+  Date date;
+  if (!reader_.align(8) || !reader_.read(date.secondsSince1970)) return malformed(type);
+  value = Value(date);
+  return true;
+}
+
+bool Decoder::decodeVariant(unsigned level, Value& value) {
+  std::string_view type;
+  if (!reader_.readVariantSignature(type)) return malformed("v");
+  switch (shapeOfType(type)) {
+    case SignatureShape::kTaken:
+      return decode(type, level, value);
+    case SignatureShape::kUnsupported:
+      return refuse(Kind::kUnsupported, "values of this signature are not taken", type);
+    case SignatureShape::kTooDeep:
+      return refuse(Kind::kUnsupported, "signatures that nest so deep are not taken", type);
+    case SignatureShape::kBroken:
+      break;
+  }
+  return refuse(Kind::kMalformed, "a variant whose signature is not valid", type);
+}
+
+bool Decoder::decodeData(Value& value) {
+  std::size_t outerLimit = 0;
+  if (!reader_.enterArray(1, outerLimit)) return malformed("ay");
+  value = Value(Data(reader_.takeRest()));
+  reader_.leaveArray(outerLimit);
+  return true;
+}
+
+bool Decoder::decodeArray(std::string_view type, unsigned level, Value& value) {
+  const std::string_view elementType = type.substr(1);
+  std::size_t outerLimit = 0;
+  if (!reader_.enterArray(alignmentOf(elementType.front()), outerLimit)) return malformed(type);
+  const std::size_t first = scratch_.values.size();
+  while (!reader_.atLimit()) {
+    Value element;
+    if (!decode(elementType, level, element)) {
+      path_.putBefore(scratch_.values.size() - first);
+      return false;
+    }
+    scratch_.values.push_back(std::move(element));
+  }
+  reader_.leaveArray(outerLimit);
+  value = Value(Array(std::span<const Value>(scratch_.values).subspan(first)));
+  scratch_.values.resize(first);
+  return true;
+}
+
+bool Decoder::decodeDictionary(std::string_view type, unsigned level, Value& value) {
+  std::size_t outerLimit = 0;
+  if (!reader_.enterArray(8, outerLimit)) return malformed(type);
+  const std::size_t first = scratch_.entries.size();
+  while (!reader_.atLimit()) {
+    if (!decodeEntry(type, level)) return false;
+  }
+  reader_.leaveArray(outerLimit);
+
+  Dictionary dictionary;
+  dictionary.reserve(scratch_.entries.size() - first);
+  for (auto& entry : std::span(scratch_.entries).subspan(first)) {
+    dictionary.set(entry.key, std::move(entry.value));
+  }
+  scratch_.entries.erase(scratch_.entries.begin() + static_cast<std::ptrdiff_t>(first),
+                         scratch_.entries.end());
+  value = Value(std::move(dictionary));
+  return true;
+}
+
+bool Decoder::decodeEntry(std::string_view type, unsigned level) {
+  // a{s…}: what is between the key's type and the closing brace.
+  const std::string_view valueType = type.substr(3, type.size() - 4);
+  std::string_view key;
+  if (!reader_.align(8) || !reader_.readText(key)) return malformed(type);
+  Value value;
+  if (!decode(valueType, level, value)) {
+    path_.putBefore(key);
+    return false;
+  }
+  scratch_.entries.push_back({Key(key), std::move(value)});
+  return true;
+}
+
+DecodeError Decoder::error() const {
+  DecodeError error;
+  error.kind = kind_;
+  error.key = path_.text();
+  error.signature = quotable(signature_);
+  error.message = error.key + (error.key.empty() ? "" : ": ");
+  error.message += problem_;
+  error.message += " (signature \"" + error.signature + "\"";
+  if (kind_ == Kind::kMalformed) {
+    error.message += ", byte " + std::to_string(reader_.position()) + " of the body";
+  }
+  error.message += ")";
+  return error;
+}
+
+DecodeError wrongSignature(std::string_view found, std::string_view expected) {
+  DecodeError error{Kind::kWrongSignature, {}, std::string(found), {}};
+  error.message = "the signature of the arguments is \"" + error.signature + "\" where \"";
+  error.message += expected;
+  error.message += "\" is expected";
+  return error;
+}
+
+}  // namespace
+
+std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expectedSignature,
+                                      std::vector<Value>& arguments) {
+  arguments.clear();
+  if (frame.header.signature != expectedSignature) {
+    return wrongSignature(frame.header.signature, expectedSignature);
+  }
+  Scratch& scratch = scratchOfThread();
+  Decoder decoder(frame, scratch);
+  std::optional<DecodeError> error;
+  if (!decoder.decodeArguments(expectedSignature, arguments)) {
+    error = decoder.error();
+    arguments.clear();
+  }
+  scratch.clear();
+  return error;
+}
+
+}  // namespace halvox::platform::linux_::dbus
