@@ -3,8 +3,8 @@
 #include <chrono>
 #include <cstdint>
 #include <filesystem>
+#include <functional>
 #include <map>
-#include <optional>
 #include <string>
 #include <variant>
 #include <vector>
@@ -15,6 +15,10 @@
 namespace halvox::platform::linux_ {
 
 enum class BusKind : std::uint8_t { kNone, kSession, kSystem };
+
+// Feature switches by domain and name.
+using FeatureSwitches =
+    std::map<std::string, std::map<std::string, bool, std::less<>>, std::less<>>;
 
 // All that the configuration file can say, with the defaults for what it does not.
 // Plain data: read once at start, then only read.
@@ -44,13 +48,18 @@ struct Configuration {
   Analytics analytics;
   Limits limits;
   LogLevel logLevel = LogLevel::kDefault;
-  Dictionary device;                                            // [device]: property to value
-  std::map<std::string, std::map<std::string, bool>> features;  // [features.Domain]: name to switch
+  Dictionary device;         // [device]: property to value
+  FeatureSwitches features;  // [features.Domain]: name to switch
 };
 
-// Why a configuration was not taken. `description` is one line for the user: file, line, column,
-// the key and what was expected of it.
+// Why a configuration was not taken. `description` is one line for the user: for a wrong file
+// "FILE:LINE:COLUMN: KEY: expected X, found Y", for an unreadable one the file and the reason.
 struct ConfigurationError {
+  enum class Kind : std::uint8_t {
+    kWrong,       // the file's content: exit status 78
+    kUnreadable,  // there is no reading it: exit status 66
+  };
+  Kind kind = Kind::kWrong;
   std::string description;
 };
 
@@ -58,9 +67,13 @@ struct ConfigurationError {
 // (~/.config when unset), else /etc/halvox/halvox.toml.
 std::filesystem::path configurationPath();
 
+// The configuration of an absent file: all defaults, those of the environment included.
+Configuration defaultConfiguration();
+
 // Reads the configuration from the file that the environment names, with defaults from the
 // environment ($RUNTIME_DIRECTORY, $STATE_DIRECTORY, $XDG_...). A missing file means all defaults,
-// but a file that $HALVOX_CONFIG names must exist.
+// but a file that $HALVOX_CONFIG names must exist. Of several mistakes the first in the file is
+// told.
 std::variant<Configuration, ConfigurationError> loadConfiguration();
 
 }  // namespace halvox::platform::linux_

@@ -1,0 +1,61 @@
+#pragma once
+
+#include <chrono>
+#include <condition_variable>
+#include <mutex>
+
+// Annotations by which clang proves at compile time that shared fields are touched under their
+// lock. Other compilers see nothing.
+#if defined(__clang__)
+#define HALVOX_THREAD_ANNOTATION(x) __attribute__((x))
+#else
+#define HALVOX_THREAD_ANNOTATION(x)
+#endif
+#define HALVOX_GUARDED_BY(mutex) HALVOX_THREAD_ANNOTATION(guarded_by(mutex))
+#define HALVOX_REQUIRES(mutex) HALVOX_THREAD_ANNOTATION(requires_capability(mutex))
+#define HALVOX_EXCLUDES(mutex) HALVOX_THREAD_ANNOTATION(locks_excluded(mutex))
+
+namespace halvox::platform::linux_ {
+
+// std::mutex as clang's analysis knows it.
+class HALVOX_THREAD_ANNOTATION(capability("mutex")) Mutex {
+ public:
+  void lock() HALVOX_THREAD_ANNOTATION(acquire_capability()) { mutex_.lock(); }
+  void unlock() HALVOX_THREAD_ANNOTATION(release_capability()) { mutex_.unlock(); }
+
+ private:
+  std::mutex mutex_;
+};
+
+// Holds a mutex for a scope.
+class HALVOX_THREAD_ANNOTATION(scoped_lockable) MutexLock {
+ public:
+  explicit MutexLock(Mutex& mutex) HALVOX_THREAD_ANNOTATION(acquire_capability(mutex))
+      : mutex_(mutex) {
+    mutex_.lock();
+  }
+  ~MutexLock() HALVOX_THREAD_ANNOTATION(release_capability()) { mutex_.unlock(); }
+  MutexLock(const MutexLock&) = delete;
+  MutexLock& operator=(const MutexLock&) = delete;
+
+ private:
+  Mutex& mutex_;
+};
+
+// A condition to wait on under a Mutex; may wake up for nothing, so callers loop.
+class Condition {
+ public:
+  void wait(Mutex& mutex) HALVOX_REQUIRES(mutex) { condition_.wait(mutex); }
+  // False when the deadline passed.
+  bool waitUntil(Mutex& mutex, std::chrono::steady_clock::time_point deadline)
+      HALVOX_REQUIRES(mutex) {
+    return condition_.wait_until(mutex, deadline) == std::cv_status::no_timeout;
+  }
+  void notifyOne() noexcept { condition_.notify_one(); }
+  void notifyAll() noexcept { condition_.notify_all(); }
+
+ private:
+  std::condition_variable_any condition_;
+};
+
+}  // namespace halvox::platform::linux_

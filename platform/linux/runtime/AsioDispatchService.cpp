@@ -1,0 +1,81 @@
+#include "platform/linux/runtime/AsioDispatchService.h"
+
+#include <source_location>
+#include <string>
+#include <system_error>
+#include <utility>
+
+#include "platform/linux/runtime/DispatchPool.h"
+#include "platform/linux/runtime/JobRunner.h"
+#include "platform/linux/runtime/OwnThreadQueue.h"
+
+namespace halvox::platform::linux_ {
+
+AsioDispatchService::AsioDispatchService(LogService& log, StatisticsService& statistics)
+    : log_(log.createCategory("com.tarno.halvox", "dispatch")),
+      runner_(std::make_shared<JobRunner>(log, statistics)),
+      pool_(std::make_shared<DispatchPool>(runner_)) {}
+
+AsioDispatchService::~AsioDispatchService() { stop(std::chrono::hours(24 * 365)); }
+
+std::shared_ptr<DispatchQueue> AsioDispatchService::createSerialQueue(std::string_view label,
+                                                                      QualityOfService quality,
+                                                                      QueueThreading threading) {
+  if (threading == QueueThreading::kOwnThread) {
+    if (auto queue = createOwnThreadQueue(label, quality)) return queue;
+  }
+  return std::make_shared<SharedQueue>(pool_);
+}
+
+void AsioDispatchService::asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) {
+  pool_->delayedJobs().add(delay, std::move(job));
+}
+
+void AsioDispatchService::beginHelping() { HelpingThread::current().begin(); }
+
+void AsioDispatchService::endHelping() { HelpingThread::current().end(); }
+
+bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
+  const auto deadline = std::chrono::steady_clock::now() + limit;
+  std::vector<std::shared_ptr<OwnThreadQueue>> queues;
+  {
+    const MutexLock lock(mutex_);
+    isStopped_ = true;
+    queues = ownThreadQueues_;
+  }
+  for (const auto& queue : queues) queue->stop();
+  pool_->stop();
+  for (const auto& queue : queues) {
+    if (!queue->waitForEnd(deadline)) return false;
+  }
+  if (!pool_->waitForEnd(deadline)) return false;
+  pool_->discardJobs();
+  const MutexLock lock(mutex_);
+  ownThreadQueues_.clear();
+  return true;
+}
+
+// None when the system has no thread to give or the service has stopped: the caller's jobs then run
+// on the pool, or not at all.
+std::shared_ptr<DispatchQueue> AsioDispatchService::createOwnThreadQueue(std::string_view label,
+                                                                         QualityOfService quality) {
+  const MutexLock lock(mutex_);
+  if (isStopped_) return nullptr;
+  std::erase_if(ownThreadQueues_, [](const auto& queue) { return queue->hasEnded(); });
+  try {
+    auto queue = OwnThreadQueue::start(std::string(label), quality, runner_);
+    ownThreadQueues_.push_back(queue);
+    // What is handed out closes the queue when its last holder lets go; the queue itself stays here
+    // until its thread has ended, so that the thread never has to wait for itself.
+    DispatchQueue* const face = queue.get();
+    return {face, [queue = std::move(queue)](DispatchQueue*) { queue->close(); }};
+  } catch (const std::system_error& error) {
+    log_.write(LogLevel::kError,
+               detail::logPrefix("AsioDispatchService", std::source_location::current().line()) +
+                   "no thread for queue " + std::string(label) +
+                   ", it uses the pool: " + error.what());
+    return nullptr;
+  }
+}
+
+}  // namespace halvox::platform::linux_

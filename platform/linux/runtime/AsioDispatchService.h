@@ -1,0 +1,60 @@
+#pragma once
+
+#include <chrono>
+#include <memory>
+#include <string_view>
+#include <vector>
+
+#include "platform/dispatch.h"
+#include "platform/linux/Mutex.h"
+#include "platform/log.h"
+#include "platform/statistics.h"
+
+namespace halvox::platform::linux_ {
+
+class DispatchPool;
+class JobRunner;
+class OwnThreadQueue;
+
+// Queues over threads of their own and over a small pool (Asio). Nothing runs while nothing is to
+// be done. A job that throws is logged and counted; its queue goes on.
+//
+// Helping: a thread that hands a batch of requests to a queue puts them between beginHelping() and
+// endHelping(). Brief jobs that it adds to a queue with an own thread then wake nobody; at the end
+// it carries them out itself, as long as no job that may block is in front of them and the queue's
+// own thread is not at work. A small batch so costs no change of threads. The order of jobs is kept
+// and never two of a queue run at once, whoever runs them.
+class AsioDispatchService final : public DispatchService {
+ public:
+  // Both services must outlive this one and its queues.
+  AsioDispatchService(LogService& log, StatisticsService& statistics);
+  // Stops, and waits for the jobs that run without a limit.
+  ~AsioDispatchService() override;
+
+  std::shared_ptr<DispatchQueue> createSerialQueue(std::string_view label, QualityOfService quality,
+                                                   QueueThreading threading) override;
+  void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) override;
+
+  // From the same thread, in turns. Whoever begins must reach the end soon: the jobs wait for it.
+  void beginHelping();
+  void endHelping();
+
+  // Ends all threads: the jobs that run end, those that wait and those to come are discarded and
+  // counted. Waits for `limit` at most; false when a job still runs then, and the process should
+  // end without destroying this. May be called again; not from a job.
+  bool stop(std::chrono::milliseconds limit);
+
+ private:
+  std::shared_ptr<DispatchQueue> createOwnThreadQueue(std::string_view label,
+                                                      QualityOfService quality);
+
+  LogCategory& log_;
+  const std::shared_ptr<JobRunner> runner_;
+  const std::shared_ptr<DispatchPool> pool_;
+  Mutex mutex_;
+  bool isStopped_ HALVOX_GUARDED_BY(mutex_) = false;
+  // All whose thread may still run; ended ones are removed when a new one is made.
+  std::vector<std::shared_ptr<OwnThreadQueue>> ownThreadQueues_ HALVOX_GUARDED_BY(mutex_);
+};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,201 @@
+#include "platform/linux/runtime/Configuration.h"
+
+#include <array>
+#include <cerrno>
+#include <cstdlib>
+#include <limits>
+#include <system_error>
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/runtime/ConfigurationEnvironment.h"
+#include "platform/linux/runtime/ConfigurationReader.h"
+#include "platform/linux/runtime/Utf8.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::size_t kLargestFile = 1U << 20U;
+constexpr std::size_t kLongestPath = 4000;
+constexpr std::size_t kLongestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
+constexpr NumberRange kDays{1, 36'500};
+constexpr NumberRange kMegabytes{1, 1U << 20U};
+constexpr NumberRange kSessions{1, 1'000'000'000};
+
+const char* configurationVariable() {
+  const char* named = std::getenv("HALVOX_CONFIG");
+  return named != nullptr && *named != '\0' ? named : nullptr;
+}
+
+std::string oneLine(std::string_view text) {
+  std::string line;
+  appendEscaped(line, text, std::numeric_limits<std::size_t>::max());
+  return line;
+}
+
+ConfigurationError unreadable(const std::filesystem::path& file, int error) {
+  return {ConfigurationError::Kind::kUnreadable,
+          oneLine(fmt::format("{}: the configuration cannot be read: {}", file.native(),
+                              std::system_category().message(error)))};
+}
+
+// The file's text; none when there is no such file.
+std::variant<std::optional<std::string>, ConfigurationError> readText(
+    const std::filesystem::path& file) {
+  // Opening does not block, so that a pipe nobody writes to cannot hold up the start.
+  const UniqueFd descriptor(::open(file.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+  if (!descriptor) {
+    if (errno == ENOENT || errno == ENOTDIR) return std::nullopt;
+    return unreadable(file, errno);
+  }
+  ::fcntl(descriptor.get(), F_SETFL, 0);
+  std::string text;
+  std::array<char, 16'384> buffer;
+  while (text.size() <= kLargestFile) {
+    const ssize_t count = ::read(descriptor.get(), buffer.data(), buffer.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return unreadable(file, errno);
+    if (count == 0) return text;
+    text.append(buffer.data(), static_cast<std::size_t>(count));
+  }
+  return ConfigurationError{
+      ConfigurationError::Kind::kWrong,
+      oneLine(fmt::format("{}:1:1: the file: expected at most {} bytes, found more", file.native(),
+                          kLargestFile))};
+}
+
+void readListener(TableReader table, Configuration::Listener& listener) {
+  table.read("socket", listener.socket, kLongestSocketPath);
+  auto bus = static_cast<std::size_t>(listener.bus);
+  table.readChoice("bus", {"none", "session", "system"}, bus);
+  listener.bus = static_cast<BusKind>(bus);
+  table.readSeconds("handshake_seconds", listener.handshakeTimeout);
+  table.readSeconds("message_seconds", listener.messageTimeout);
+  table.finish();
+}
+
+void readStorage(TableReader table, Configuration::Storage& storage) {
+  std::filesystem::path root;
+  std::uint64_t days = storage.retentionDays;
+  std::uint64_t megabytes = storage.maxMegabytes;
+  table.read("directory", storage.directory, kLongestPath);
+  table.read("root", root, kLongestPath);
+  table.read("retention_days", kDays, days);
+  table.read("max_megabytes", kMegabytes, megabytes);
+  table.finish();
+  storage.root = root.empty() ? storage.directory / "root" : root;
+  storage.retentionDays = static_cast<std::uint32_t>(days);
+  storage.maxMegabytes = static_cast<std::uint32_t>(megabytes);
+}
+
+void readAnalytics(TableReader table, Configuration::Analytics& analytics) {
+  std::size_t sink = 0;
+  table.read("wanted", analytics.wanted);
+  // Another sink must not be taken for this one in silence: the events would go the wrong way.
+  table.readChoice("sink", {"sqlite"}, sink);
+  table.finish();
+}
+
+void readLimits(TableReader table, Configuration::Limits& limits) {
+  table.read("client_history_megabytes", kMegabytes, limits.clientHistoryMegabytes);
+  table.read("client_sessions", kSessions, limits.clientSessions);
+  table.finish();
+}
+
+void readLog(TableReader table, LogLevel& level) {
+  auto chosen = static_cast<std::size_t>(level);
+  table.readChoice("level", {"debug", "info", "default", "error"}, chosen);
+  level = static_cast<LogLevel>(chosen);
+  table.finish();
+}
+
+void readFeatures(TableReader table, FeatureSwitches& features) {
+  for (auto& [domain, switches] : table.readTables()) features[domain] = switches.readSwitches();
+}
+
+// Tables that are valid in a file but that nothing reads yet: only their types are checked.
+void checkOtherTables(TableReader& root) {
+  std::string text;
+  std::vector<std::string> texts;
+  std::filesystem::path path;
+  std::size_t choice = 0;
+  bool flag = false;
+
+  TableReader link = root.table("link");
+  link.readChoice("backend", {"local", "nats", "none"}, choice);
+  link.read("servers", texts);
+  link.read("subject", text);
+  link.read("stream", text);
+  link.finish();
+  for (const std::string_view name : {"preferences", "notify"}) {
+    TableReader table = root.table(name);
+    table.read("directory", path, kLongestPath);
+    table.finish();
+  }
+  TableReader drivers = root.table("drivers");
+  drivers.read("alsa", flag);
+  drivers.read("alsa_root", path, kLongestPath);
+  drivers.read("pipewire", flag);
+  drivers.read("textfiles", path, kLongestPath);
+  drivers.finish();
+}
+
+std::variant<Configuration, ConfigurationError> parse(const std::string& file,
+                                                      std::string_view text) {
+  ConfigurationMistakes mistakes(file);
+  const toml::parse_result parsed = toml::parse(text);
+  if (!parsed) {
+    const toml::parse_error& error = parsed.error();
+    mistakes.add(error.source().begin,
+                 fmt::format("the file: expected TOML, found a mistake: {}", error.description()));
+    return *mistakes.first();
+  }
+  Configuration configuration = defaultConfiguration();
+  TableReader root(&parsed.table(), "", mistakes);
+  readListener(root.table("listener"), configuration.listener);
+  readStorage(root.table("storage"), configuration.storage);
+  readAnalytics(root.table("analytics"), configuration.analytics);
+  readLimits(root.table("limits"), configuration.limits);
+  readLog(root.table("log"), configuration.logLevel);
+  readFeatures(root.table("features"), configuration.features);
+  configuration.device = root.table("device").readValues();
+  checkOtherTables(root);
+  root.finish();
+  if (mistakes.first().has_value()) return *mistakes.first();
+  return configuration;
+}
+
+}  // namespace
+
+std::filesystem::path configurationPath() {
+  if (const char* named = configurationVariable()) return named;
+  const std::filesystem::path own =
+      environmentPath("XDG_CONFIG_HOME").value_or(homeDirectory() / ".config") /
+      "halvox/halvox.toml";
+  const bool isMissing = ::access(own.c_str(), F_OK) != 0 && (errno == ENOENT || errno == ENOTDIR);
+  return isMissing ? "/etc/halvox/halvox.toml" : own;
+}
+
+Configuration defaultConfiguration() {
+  Configuration configuration;
+  configuration.listener.socket = defaultSocketPath();
+  configuration.storage.directory = defaultStorageDirectory();
+  configuration.storage.root = configuration.storage.directory / "root";
+  return configuration;
+}
+
+std::variant<Configuration, ConfigurationError> loadConfiguration() {
+  const std::filesystem::path file = configurationPath();
+  auto content = readText(file);
+  if (auto* error = std::get_if<ConfigurationError>(&content)) return *std::move(error);
+  const auto& text = std::get<std::optional<std::string>>(content);
+  if (text.has_value()) return parse(file.native(), *text);
+  if (configurationVariable() != nullptr) return unreadable(file, ENOENT);
+  return defaultConfiguration();
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,71 @@
+#include "platform/linux/runtime/DelayedJobs.h"
+
+#include <algorithm>
+#include <utility>
+
+#include <asio/post.hpp>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// Far below the end of the clock, which is some 292 years after the start of the machine.
+constexpr std::chrono::nanoseconds kLongestDelay = std::chrono::hours(24 * 3652);
+
+}  // namespace
+
+DelayedJobs::DelayedJobs(asio::io_context& context, JobRunner& runner)
+    : context_(context), runner_(runner), timer_(context) {}
+
+void DelayedJobs::add(std::chrono::nanoseconds delay, Job job) {
+  const Time due = std::chrono::steady_clock::now() +
+                   std::clamp(delay, std::chrono::nanoseconds(0), kLongestDelay);
+  const MutexLock lock(mutex_);
+  if (isStopped_) {
+    runner_.countDiscarded(1);
+    return;
+  }
+  const auto place = jobs_.emplace(due, std::move(job));
+  if (place == jobs_.begin()) arm();
+}
+
+void DelayedJobs::stop() {
+  std::multimap<Time, Job> discarded;
+  {
+    const MutexLock lock(mutex_);
+    isStopped_ = true;
+    discarded.swap(jobs_);
+    timer_.cancel();
+  }
+  if (!discarded.empty()) runner_.countDiscarded(discarded.size());
+}
+
+// Sets the timer to the earliest job, in the place of what it waited for.
+void DelayedJobs::arm() {
+  timer_.expires_at(jobs_.begin()->first);
+  timer_.async_wait([this](const asio::error_code& error) {
+    if (!error) onTimer();
+  });
+}
+
+void DelayedJobs::onTimer() {
+  const MutexLock lock(mutex_);
+  const auto end = jobs_.upper_bound(std::chrono::steady_clock::now());
+  while (jobs_.begin() != end) {
+    auto node = jobs_.extract(jobs_.begin());
+    asio::post(context_, [this, job = std::move(node.mapped())] { runDue(job); });
+  }
+  if (!jobs_.empty()) arm();
+}
+
+void DelayedJobs::runDue(const Job& job) {
+  bool isStopped = false;
+  {
+    const MutexLock lock(mutex_);
+    isStopped = isStopped_;
+  }
+  if (isStopped) return runner_.countDiscarded(1);
+  const JobRunner::Scope scope(nullptr);
+  runner_.run(job);
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,29 @@
+#include "platform/linux/runtime/JobRunner.h"
+
+#include <exception>
+#include <source_location>
+#include <string>
+
+namespace halvox::platform::linux_ {
+
+JobRunner::JobRunner(LogService& log, StatisticsService& statistics)
+    : log_(log.createCategory("com.tarno.halvox", "dispatch")),
+      failed_(statistics.counter("dispatch", "jobs that failed")),
+      discarded_(statistics.counter("dispatch", "jobs discarded at the stop")) {}
+
+void JobRunner::reportFailure() noexcept {
+  failed_.add();
+  std::string what = "of an unknown kind";
+  try {
+    throw;
+  } catch (const std::exception& exception) {
+    what = exception.what();
+  } catch (...) {
+    // Nothing more is known about it.
+  }
+  log_.write(LogLevel::kError,
+             detail::logPrefix("JobRunner", std::source_location::current().line()) +
+                 "a job failed with an exception: " + what);
+}
+
+}  // namespace halvox::platform::linux_

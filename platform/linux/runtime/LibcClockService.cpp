@@ -1,0 +1,74 @@
+#include "platform/linux/runtime/LibcClockService.h"
+
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <cstdint>
+#include <ctime>
+#include <optional>
+#include <string_view>
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include "platform/linux/UniqueHandle.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+std::chrono::nanoseconds read(clockid_t clock) {
+  timespec time{};
+  ::clock_gettime(clock, &time);
+  return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
+}
+
+// The start time in the text of /proc/self/stat, in clock ticks since the system started.
+std::optional<std::int64_t> startTicks(std::string_view stat) {
+  // The command name, second of the fields, may hold blanks and parentheses: count from its end.
+  constexpr int kFieldsAfterName = 20;  // the start time is field 22
+  const std::size_t end = stat.rfind(')');
+  if (end == std::string_view::npos) return std::nullopt;
+  std::string_view rest = stat.substr(end + 1);
+  for (int field = 0; field < kFieldsAfterName; ++field) {
+    const std::size_t blank = rest.find(' ');
+    if (blank == std::string_view::npos) return std::nullopt;
+    rest.remove_prefix(blank + 1);
+  }
+  std::int64_t ticks = 0;
+  const auto result = std::from_chars(rest.data(), rest.data() + rest.size(), ticks);
+  if (result.ec != std::errc{}) return std::nullopt;
+  return ticks;
+}
+
+std::chrono::nanoseconds ownStart() {
+  const std::chrono::nanoseconds now = read(CLOCK_BOOTTIME);
+  const UniqueFd file(::open("/proc/self/stat", O_RDONLY | O_CLOEXEC));
+  std::array<char, 1024> buffer;
+  const ssize_t count = file ? ::read(file.get(), buffer.data(), buffer.size()) : -1;
+  const std::int64_t ticksPerSecond = ::sysconf(_SC_CLK_TCK);
+  if (count <= 0 || ticksPerSecond <= 0) return now;
+  const auto ticks = startTicks({buffer.data(), static_cast<std::size_t>(count)});
+  if (!ticks.has_value()) return now;
+  const std::chrono::nanoseconds tick =
+      std::chrono::nanoseconds(std::chrono::seconds(1)) / ticksPerSecond;
+  return std::min(now, *ticks * tick);
+}
+
+}  // namespace
+
+LibcClockService::LibcClockService() : processStart_(ownStart()) {}
+
+Date LibcClockService::currentDate() const {
+  return {std::chrono::duration<double>(read(CLOCK_REALTIME)).count()};
+}
+
+std::chrono::duration<double> LibcClockService::systemUptime() const {
+  return read(CLOCK_BOOTTIME);
+}
+
+std::chrono::milliseconds LibcClockService::processUptime() const {
+  return std::chrono::duration_cast<std::chrono::milliseconds>(read(CLOCK_BOOTTIME) -
+                                                               processStart_);
+}
+
+}  // namespace halvox::platform::linux_
