@@ -16,9 +16,9 @@ namespace halvox::platform {
 
 // An error that goes back to a client.
 struct Error {
-  std::string domain;
+  std::string domain{};
   std::int64_t code = 0;
-  std::string description;
+  std::string description{};
   // The error's name on the wire as it stands; when empty, the name is made of domain and code.
   std::string name{};
   friend bool operator==(const Error&, const Error&) = default;
