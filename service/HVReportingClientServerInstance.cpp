@@ -1,0 +1,175 @@
+#include "service/HVReportingClientServerInstance.h"
+
+#include <utility>
+
+#include "backends/HVReportingUtility.h"
+#include "platform/connection.h"
+#include "platform/services.h"
+#include "platform/statistics.h"
+#include "service/ReportingQueue.h"
+#include "service/ServiceLog.h"
+
+namespace halvox {
+namespace {
+
+constexpr int kKilledExitStatus = 2;
+
+// received = carried out, once the queue is empty.
+struct RequestCounters {
+  platform::Counter& received;
+  platform::Counter& carriedOut;
+};
+
+const RequestCounters& counters() {
+  constexpr std::string_view kPiece = "requests";
+  platform::StatisticsService& statistics = platform::statistics();
+  static const RequestCounters made{statistics.counter(kPiece, "received"),
+                                    statistics.counter(kPiece, "carried out")};
+  return made;
+}
+
+}  // namespace
+
+HVReportingClientServerInstance::HVReportingClientServerInstance(
+    platform::ProcessID pid, std::weak_ptr<HVReportingServiceDelegateProtocol> delegate)
+    : processIdentifier_(pid), delegate_(std::move(delegate)) {
+  kServiceLog.notice("new client with pid ", pid);
+}
+
+HVReportingClientServerInstance::~HVReportingClientServerInstance() {
+  kServiceLog.notice("dealloc ", processIdentifier_, " from the server client list");
+}
+
+std::optional<platform::Date> HVReportingClientServerInstance::clientStartDate() const {
+  return clientStartDate_.copy();
+}
+
+void HVReportingClientServerInstance::setClientStartDate(platform::Date date) {
+  clientStartDate_.set(date);
+}
+
+std::optional<std::string> HVReportingClientServerInstance::clientProcessName() const {
+  return clientProcessName_.copy();
+}
+
+void HVReportingClientServerInstance::setClientProcessName(std::optional<std::string> name) {
+  clientProcessName_.set(std::move(name));
+}
+
+HVReportingClientServerInstance::Session HVReportingClientServerInstance::findReportingSessionForID(
+    ReporterID reporterID, Lookup lookup) const {
+  if (const auto own = sessions_.find(reporterID); own != sessions_.end()) return own->second;
+  if (lookup == Lookup::kOwnSessions) return nullptr;
+  const Delegate delegate = delegate_.lock();
+  return delegate == nullptr ? nullptr : delegate->findReportingSessionForID(reporterID);
+}
+
+// The job holds the client, so that requests of a connection that has ended are carried out, and
+// the request's token, so that the connection knows how much of its work is open.
+template <typename Work>
+void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight, Work work) {
+  counters().received.add();
+  reportingQueue()->async(
+      weight, [client = shared_from_this(), request = platform::connections().currentRequest(),
+               work = std::move(work)]() mutable {
+        work(*client);
+        counters().carriedOut.add();
+      });
+}
+
+void HVReportingClientServerInstance::createReportingSession(ReporterID reporterID,
+                                                             BoolReply reply) {
+  queueRequest(platform::JobWeight::kBrief, [reporterID, reply = std::move(reply)](auto& client) {
+    client.carryOutCreate(reporterID, reply);
+  });
+}
+
+void HVReportingClientServerInstance::setServiceType(AudioServiceType serviceType,
+                                                     ReporterID reportingSession, BoolReply reply) {
+  queueRequest(platform::JobWeight::kBrief,
+               [serviceType, reportingSession, reply = std::move(reply)](auto& client) {
+                 client.carryOutSetServiceType(serviceType, reportingSession, reply);
+               });
+}
+
+void HVReportingClientServerInstance::getServiceNameForReporterID(ReporterID reporterID,
+                                                                  ServiceTypeReply reply) {
+  queueRequest(platform::JobWeight::kBrief, [reporterID, reply = std::move(reply)](auto& client) {
+    client.carryOutGetServiceName(reporterID, reply);
+  });
+}
+
+void HVReportingClientServerInstance::setConfiguration(platform::Dictionary configuration,
+                                                       ReporterID reporterID, BoolReply reply) {
+  queueRequest(platform::JobWeight::kBrief, [configuration = std::move(configuration), reporterID,
+                                             reply = std::move(reply)](auto& client) {
+    client.carryOutSetConfiguration(configuration, reporterID, reply);
+  });
+}
+
+void HVReportingClientServerInstance::startReportingSessionForID(ReporterID reporterID,
+                                                                 BoolReply reply) {
+  queueRequest(platform::JobWeight::kMayBlock,
+               [reporterID, reply = std::move(reply)](auto& client) {
+                 client.carryOutStart(reporterID, reply);
+               });
+}
+
+void HVReportingClientServerInstance::sendMessage(platform::Message message,
+                                                  AudioEventCategory category, AudioEventType type,
+                                                  ReporterIDs reporterIDs, ErrorReply reply) {
+  queueRequest(platform::JobWeight::kBrief,
+               [request = MessageRequest{std::move(message), category, type, std::move(reporterIDs),
+                                         senderProcessName(), std::move(reply)}](
+                   auto& client) mutable { client.carryOutSend(request); });
+}
+
+void HVReportingClientServerInstance::stopReportingSessionForID(ReporterID reporterID,
+                                                                BoolReply reply) {
+  queueRequest(platform::JobWeight::kMayBlock,
+               [reporterID, reply = std::move(reply)](auto& client) {
+                 client.carryOutStop(reporterID, reply);
+               });
+}
+
+void HVReportingClientServerInstance::destroyReportingSession(ReporterID reporterID,
+                                                              BoolReply reply) {
+  queueRequest(platform::JobWeight::kMayBlock,
+               [reporterID, reply = std::move(reply)](auto& client) {
+                 client.carryOutDestroy(reporterID, reply);
+               });
+}
+
+void HVReportingClientServerInstance::reporterIDValid(ReporterID reporterID,
+                                                      DictionaryReply reply) {
+  queueRequest(platform::JobWeight::kBrief, [reporterID, reply = std::move(reply)](auto& client) {
+    client.carryOutReporterIDValid(reporterID, reply);
+  });
+}
+
+void HVReportingClientServerInstance::getAllReporters(ReportersReply reply) {
+  queueRequest(platform::JobWeight::kBrief,
+               [reply = std::move(reply)](auto& client) { client.carryOutGetAllReporters(reply); });
+}
+
+// On the connection's thread, in front of everything that is queued.
+void HVReportingClientServerInstance::killService(BoolReply /*reply*/) {
+  kServiceLog.notice("DESTROYING SERVICE");
+  platform::process().terminate(kKilledExitStatus);
+}
+
+// A look-up reads a file, which no message can afford; so a process is looked up once. That misses
+// a process that takes another program or another name later: its messages keep the name that it
+// had at the first one. Another process under the same pid cannot be mistaken for it, since a pid
+// is not given away while the process that opened the connection lives, and the connection ends
+// with it.
+HVReportingClientServerInstance::ProcessName HVReportingClientServerInstance::senderProcessName() {
+  const platform::NSXPCConnection* connection = platform::connections().currentConnection();
+  const platform::ProcessID pid = connection == nullptr ? 0 : connection->processIdentifier();
+  if (pid == senderName_.pid) return senderName_.name;
+  std::optional<std::string> name = HVReportingUtilityProcessNameForPID(pid);
+  senderName_ = {pid, name ? std::make_shared<const std::string>(*std::move(name)) : nullptr};
+  return senderName_.name;
+}
+
+}  // namespace halvox

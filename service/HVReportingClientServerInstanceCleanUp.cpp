@@ -1,0 +1,53 @@
+#include <algorithm>
+#include <utility>
+
+#include "service/HVReportingClientServerInstance.h"
+#include "service/ReportingQueue.h"
+#include "service/ServiceLog.h"
+
+// How sessions enter and leave a client, and how a client leaves the service.
+namespace halvox {
+
+void HVReportingClientServerInstance::putSession(const Session& session, const Delegate& delegate) {
+  session->chargeTo(account_);
+  Session& place = sessions_[session->reporterID()];
+  // One that was there is dropped as it is, started or not.
+  if (place != nullptr) note(place, SessionChange::kRemoved, delegate);
+  place = session;
+  note(session, SessionChange::kAdded, delegate);
+  account_->setSessions(sessions_.size());
+}
+
+void HVReportingClientServerInstance::removeSession(SessionMap::iterator place,
+                                                    const Delegate& delegate) {
+  note(place->second, SessionChange::kRemoved, delegate);
+  sessions_.erase(place);
+  account_->setSessions(sessions_.size());
+}
+
+void HVReportingClientServerInstance::note(const Session& session, SessionChange change,
+                                           const Delegate& delegate) const {
+  if (delegate != nullptr) delegate->noteSessionChange(*this, session, change);
+}
+
+void HVReportingClientServerInstance::handleConnectionError() {
+  reportingQueue()->async(platform::JobWeight::kMayBlock,
+                          [client = shared_from_this()] { client->carryOutConnectionError(); });
+}
+
+void HVReportingClientServerInstance::carryOutConnectionError() {
+  const Delegate delegate = delegate_.lock();
+  if (delegate == nullptr) return;
+  // Both an interruption and the end of the connection come here; the second finds nothing to do.
+  const auto& clients = delegate->getAllClients();
+  if (std::ranges::none_of(clients, [this](const auto& one) { return one.get() == this; })) return;
+  // As when a session is destroyed, the counter of active sessions stays and held replies go.
+  for (const auto& [reporterID, session] : sessions_) {
+    if (session->started()) session->stop();
+  }
+  while (!sessions_.empty()) removeSession(sessions_.begin(), delegate);
+  delegate->removeClient(*this);
+  kServiceLog.notice("removing ", processIdentifier_, " from the server client list");
+}
+
+}  // namespace halvox

@@ -1,0 +1,147 @@
+#include <algorithm>
+#include <cmath>
+#include <limits>
+
+#include "backends/HVReportingTallyhubBridge.h"
+#include "platform/clock.h"
+#include "platform/services.h"
+#include "platform/statistics.h"
+#include "service/HVReportingClientServerInstance.h"
+#include "service/ServiceLog.h"
+#include "session/SessionLog.h"
+#include "session/TracePoints.h"
+
+// The road of a client's message to the back-ends and sessions.
+namespace halvox {
+namespace {
+
+constexpr std::string_view kErrorDomain = "com.tarno.audio.reporting";
+constexpr std::int64_t kReportingDisabled = 1;
+// What messages that come outside any session are sent as.
+constexpr ReporterID kStandaloneReporterID{1};
+
+// received = delivered + dropped + refused.
+struct MessageCounters {
+  platform::Counter& received;
+  platform::Counter& delivered;
+  platform::Counter& noSession;
+  platform::Counter& disabled;
+};
+
+const MessageCounters& counters() {
+  constexpr std::string_view kPiece = "messages";
+  platform::StatisticsService& statistics = platform::statistics();
+  static const MessageCounters made{statistics.counter(kPiece, "received"),
+                                    statistics.counter(kPiece, "delivered"),
+                                    statistics.counter(kPiece, "dropped: no session found"),
+                                    statistics.counter(kPiece, "refused: reporting disabled")};
+  return made;
+}
+
+// The reporter IDs of a request as a log line shows them.
+class ReporterIDsDescription {
+ public:
+  explicit ReporterIDsDescription(const HVReportingServiceProtocol::ReporterIDs& reporters)
+      : reporters_(reporters) {}
+  [[nodiscard]] std::string description() const {
+    if (!reporters_.has_value()) return "(null)";
+    return ListDescription(*reporters_,
+                           [](std::string& text, ReporterID reporterID) {
+                             text += std::to_string(number(reporterID));
+                           })
+        .description();
+  }
+
+ private:
+  const HVReportingServiceProtocol::ReporterIDs& reporters_;  // owned by the request
+};
+
+// Halves go away from zero.
+std::int32_t roundedSeconds(std::chrono::duration<double> time) {
+  using Limits = std::numeric_limits<std::int32_t>;
+  return static_cast<std::int32_t>(
+      std::clamp<double>(std::round(time.count()), Limits::min(), Limits::max()));
+}
+
+// Marks the message with the time of its arrival, in the place of whatever the client sent.
+void stamp(platform::Message& message) {
+  static const platform::Key timestamp("hvreporting_timestamp");
+  static const platform::Key systemUptime("systemuptime_sec");
+  static const platform::Key processUptime("processuptime_ms");
+  constexpr std::size_t kStamps = 3;
+  if (!message.has_value()) return;
+  const platform::ClockService& clock = platform::clock();
+  message->reserve(message->size() + kStamps);
+  message->set(timestamp, clock.currentDate().secondsSince1970);
+  message->set(systemUptime, roundedSeconds(clock.systemUptime()));
+  message->set(processUptime, std::int64_t{clock.processUptime().count()});
+}
+
+}  // namespace
+
+void HVReportingClientServerInstance::carryOutSend(MessageRequest& request) {
+  kServiceLog.debug("sending message for reporter ", ReporterIDsDescription(request.reporterIDs));
+  emitTracePoint(ReportingTracePoint::kSendRequest);
+  counters().received.add();
+  const Delegate delegate = delegate_.lock();
+  if (delegate == nullptr || !delegate->isReportingEnabled()) {
+    counters().disabled.add();
+    request.reply(platform::Error{.domain = std::string(kErrorDomain), .code = kReportingDisabled});
+    return;
+  }
+  stamp(request.message);
+  if (request.reporterIDs.has_value()) {
+    sendToNamedSessions(request);
+  } else {
+    sendToActiveSessions(request, delegate);
+  }
+  request.reply(std::nullopt);
+}
+
+void HVReportingClientServerInstance::sendToNamedSessions(const MessageRequest& request) const {
+  bool delivered = false;
+  for (const ReporterID reporterID : *request.reporterIDs) {
+    if (reporterID == kNoReporterID) continue;
+    const Session session = findReportingSessionForID(reporterID, Lookup::kAcrossAllClients);
+    if (session == nullptr) continue;
+    HVReportingTallyhubBridge::handleEvent(request.message, request.category, request.type,
+                                           session);
+    session->sendMessage(request.message, request.category, request.type, nullptr);
+    delivered = true;
+  }
+  (delivered ? counters().delivered : counters().noSession).add();
+}
+
+void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest& request,
+                                                           const Delegate& delegate) const {
+  const auto sessions = delegate->getAllActiveReportingSessions();
+  kServiceLog.notice("active reporting sessions ", sessions.size(), " : ",
+                     sessionsDescription(sessions));
+  counters().delivered.add();
+  if (sessions.empty()) {
+    sendStandalone(request);
+    return;
+  }
+  // Here the session comes before the back-ends, and for named sessions after them. Both orders are
+  // intended.
+  for (const Session& session : sessions) {
+    session->sendMessage(request.message, request.category, request.type, nullptr);
+    HVReportingTallyhubBridge::handleEvent(request.message, request.category, request.type,
+                                           session);
+  }
+}
+
+void HVReportingClientServerInstance::sendStandalone(const MessageRequest& request) const {
+  const auto session = std::make_shared<HVReportingSession>(
+      kStandaloneReporterID,
+      HVReportingSession::ProcessIdentifiers{platform::process().ownProcessIdentifier()});
+  session->setServiceType(AudioServiceType::kStandalone);
+  session->updateConfigurationWithContentsOfConfiguration(
+      {{"HostApplicationDisplayID", "Unknown"}});
+  HVReportingTallyhubBridge::handleEvent(request.message, request.category, request.type, session);
+  kServiceLog.notice("no active reporting sessions found, sending as standalone");
+  HVReportingSession::sendSingleMessage(request.message, request.category, request.type,
+                                        AudioServiceType::kStandalone, {}, nullptr);
+}
+
+}  // namespace halvox

@@ -1,0 +1,208 @@
+#include <utility>
+#include <vector>
+
+#include "backends/HVReportingVocabulary.h"
+#include "platform/feature_flags.h"
+#include "platform/services.h"
+#include "platform/statistics.h"
+#include "service/HVReportingClientServerInstance.h"
+#include "service/ServiceLog.h"
+#include "session/SessionLog.h"
+#include "session/TracePoints.h"
+
+// What the client's requests do once they come up on the reporting queue; sending is elsewhere.
+namespace halvox {
+namespace {
+
+// While more sessions than this are counted, sessions that are created or started do without the
+// real-time link.
+constexpr std::int64_t kMaxSessionsWithLink = 5;
+
+// held back = delivered + those that are waiting + those dropped with their session, which the
+// session counts.
+struct StartReplyCounters {
+  platform::Counter& heldBack;
+  platform::Counter& delivered;
+};
+
+const StartReplyCounters& startReplies() {
+  constexpr std::string_view kPiece = "start replies";
+  platform::StatisticsService& statistics = platform::statistics();
+  static const StartReplyCounters made{statistics.counter(kPiece, "held back"),
+                                       statistics.counter(kPiece, "delivered")};
+  return made;
+}
+
+using Delegate = std::shared_ptr<HVReportingServiceDelegateProtocol>;
+
+bool mayUseLink(const Delegate& delegate) {
+  return delegate == nullptr || delegate->activeSessionCount() <= kMaxSessionsWithLink;
+}
+
+void addToActiveSessionCount(const Delegate& delegate, std::int64_t change) {
+  if (delegate != nullptr) delegate->setActiveSessionCount(delegate->activeSessionCount() + change);
+}
+
+void logActiveSessions(const Delegate& delegate) {
+  if (delegate == nullptr) return;
+  const auto sessions = delegate->getAllActiveReportingSessions();
+  kServiceLog.notice("", delegate->activeSessionCount(), " active reporting session(s) ",
+                     sessionsDescription(sessions));
+}
+
+void deliverHeldReply(HVReportingSession& session) {
+  const BoolReply held = session.takeTransactionCompleteBlock();
+  if (!held) return;
+  startReplies().delivered.add();
+  held(std::nullopt, true);
+}
+
+bool isTracingTest(const HVReportingSession& session) {
+  return platform::featureFlags()._os_feature_enabled_impl("Acoustat", "Tracing") &&
+         session.serviceType() == AudioServiceType::kTest;
+}
+
+}  // namespace
+
+void HVReportingClientServerInstance::carryOutCreate(ReporterID reporterID,
+                                                     const BoolReply& reply) {
+  kServiceLog.debug("creating session for reporter ", number(reporterID));
+  emitTracePoint(ReportingTracePoint::kCreateRequest);
+  const Delegate delegate = delegate_.lock();
+  const auto session = std::make_shared<HVReportingSession>(
+      reporterID, HVReportingSession::ProcessIdentifiers{processIdentifier_});
+  putSession(session, delegate);
+  session->setTlmReportingEnabled(mayUseLink(delegate));
+  kServiceLog.notice("session created for reporter ", number(reporterID));
+  reply(std::nullopt, true);
+}
+
+void HVReportingClientServerInstance::carryOutSetServiceType(AudioServiceType serviceType,
+                                                             ReporterID reporterID,
+                                                             const BoolReply& reply) {
+  kServiceLog.debug("setting service type ", number(serviceType), " for reporter ",
+                    number(reporterID));
+  const Session session = findReportingSessionForID(reporterID, Lookup::kOwnSessions);
+  if (reporterID != kNoReporterID && session != nullptr) {
+    session->setServiceType(serviceType);
+    // The second blank is as it always was.
+    kServiceLog.notice("service type ", number(serviceType), " set for reporter  ",
+                       number(reporterID));
+  }
+  reply(std::nullopt, true);
+}
+
+void HVReportingClientServerInstance::carryOutGetServiceName(ReporterID reporterID,
+                                                             const ServiceTypeReply& reply) const {
+  kServiceLog.debug("fetching seviceType");
+  // For ID 0 the reply is called a second time below. Kept as clients have always known it.
+  if (reporterID == kNoReporterID) reply(std::nullopt, AudioServiceType::kUnknown);
+  const Session session = findReportingSessionForID(reporterID, Lookup::kAcrossAllClients);
+  const AudioServiceType serviceType =
+      session == nullptr ? AudioServiceType::kUnknown : session->serviceType();
+  reply(std::nullopt, serviceType);
+  kServiceLog.notice("returning service type ", number(serviceType), " for reporter  ",
+                     number(reporterID));
+}
+
+void HVReportingClientServerInstance::carryOutSetConfiguration(
+    const platform::Dictionary& configuration, ReporterID reporterID, const BoolReply& reply) {
+  kServiceLog.debug("setting configuration");
+  const Session session = findReportingSessionForID(reporterID, Lookup::kOwnSessions);
+  if (session != nullptr) session->updateConfigurationWithContentsOfConfiguration(configuration);
+  reply(std::nullopt, true);
+}
+
+void HVReportingClientServerInstance::carryOutStart(ReporterID reporterID, const BoolReply& reply) {
+  kServiceLog.debug("starting session for reporter ", number(reporterID));
+  emitTracePoint(ReportingTracePoint::kStartRequest);
+  const Session session = findReportingSessionForID(reporterID, Lookup::kOwnSessions);
+  if (reporterID == kNoReporterID || session == nullptr || session->started()) {
+    reply(std::nullopt, true);
+    return;
+  }
+  begin(session, delegate_.lock(), reply);
+}
+
+void HVReportingClientServerInstance::begin(const Session& session, const Delegate& delegate,
+                                            const BoolReply& reply) {
+  // The counter is read after it has grown: the fifth session still gets the link, the sixth does
+  // not.
+  addToActiveSessionCount(delegate, 1);
+  session->setTlmReportingEnabled(mayUseLink(delegate));
+  session->start();
+  note(session, SessionChange::kStarted, delegate);
+  deliverHeldReply(*session);
+  startReplies().heldBack.add();
+  session->setTransactionCompleteBlock(reply);
+  // The reply stays stored all the same, and is called again when the session is stopped.
+  if (isTracingTest(*session)) reply(std::nullopt, true);
+  logActiveSessions(delegate);
+}
+
+void HVReportingClientServerInstance::carryOutStop(ReporterID reporterID, const BoolReply& reply) {
+  kServiceLog.debug("stopping session for reporter ", number(reporterID));
+  emitTracePoint(ReportingTracePoint::kStopRequest);
+  if (reporterID == kNoReporterID) {
+    reply(std::nullopt, true);
+    return;
+  }
+  const Session session = findReportingSessionForID(reporterID, Lookup::kOwnSessions);
+  if (session != nullptr && session->started()) end(session, delegate_.lock());
+  kServiceLog.notice("stopping ", number(reporterID));
+  reply(std::nullopt, true);
+}
+
+void HVReportingClientServerInstance::end(const Session& session, const Delegate& delegate) {
+  session->stop();
+  note(session, SessionChange::kStopped, delegate);
+  addToActiveSessionCount(delegate, -1);
+  deliverHeldReply(*session);
+  logActiveSessions(delegate);
+}
+
+void HVReportingClientServerInstance::carryOutDestroy(ReporterID reporterID,
+                                                      const BoolReply& reply) {
+  kServiceLog.debug("destroying session for reporter ", number(reporterID));
+  emitTracePoint(ReportingTracePoint::kDestroyRequest);
+  if (reporterID == kNoReporterID) {
+    reply(std::nullopt, true);
+    return;
+  }
+  // Unlike a stop this leaves the counter of active sessions as it is and does not deliver the
+  // reply that the start held back: it goes with the session. Both are intended.
+  if (const auto own = sessions_.find(reporterID); own != sessions_.end()) {
+    if (own->second->started()) own->second->stop();
+    removeSession(own, delegate_.lock());
+  }
+  kServiceLog.notice("destroying ", number(reporterID));
+  reply(std::nullopt, true);
+}
+
+void HVReportingClientServerInstance::carryOutReporterIDValid(ReporterID reporterID,
+                                                              const DictionaryReply& reply) const {
+  kServiceLog.debug("validating reporter ", number(reporterID));
+  platform::Dictionary result{{"reporterID", std::int64_t{0}},
+                              {"serviceType", number(AudioServiceType::kUnknown)}};
+  const Session session = findReportingSessionForID(reporterID, Lookup::kAcrossAllClients);
+  if (session != nullptr) {
+    result.set("reporterID", number(reporterID));
+    result.set("serviceType", number(session->serviceType()));
+  }
+  kServiceLog.notice("validating reporter ", number(reporterID));
+  reply(std::nullopt, result);
+}
+
+void HVReportingClientServerInstance::carryOutGetAllReporters(const ReportersReply& reply) const {
+  std::vector<ReporterID> reporters;
+  if (const Delegate delegate = delegate_.lock()) {
+    for (const auto& client : delegate->getAllClients()) {
+      for (const auto& [reporterID, session] : client->clientReportingSessionMap()) {
+        reporters.push_back(reporterID);
+      }
+    }
+  }
+  reply(std::nullopt, reporters);
+}
+
+}  // namespace halvox

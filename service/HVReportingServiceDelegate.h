@@ -1,0 +1,66 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+
+#include "platform/connection.h"
+#include "platform/process.h"
+#include "service/HVReportingServiceDelegateProtocol.h"
+#include "service/SessionIndex.h"
+
+namespace halvox {
+
+// The centre of the service: accepts every connection, keeps the list of clients, and answers what
+// client objects ask of the whole. One a process; making it makes the reporting queue.
+//
+// Connections come on their own threads, everything about clients runs on the reporting queue. Held
+// by whoever made it, always by a shared pointer, for the life of the process; clients refer to it
+// weakly. No connection is ever refused and nothing here fails.
+class HVReportingServiceDelegate final
+    : public platform::NSXPCListenerDelegate,
+      public HVReportingServiceDelegateProtocol,
+      public std::enable_shared_from_this<HVReportingServiceDelegate> {
+ public:
+  HVReportingServiceDelegate();
+  HVReportingServiceDelegate(const HVReportingServiceDelegate&) = delete;
+  HVReportingServiceDelegate& operator=(const HVReportingServiceDelegate&) = delete;
+  ~HVReportingServiceDelegate() override = default;
+
+  // Exports a new client object on the connection and queues its registration, so that it comes
+  // before all of the client's requests. Always true.
+  bool listenerShouldAcceptNewConnection(
+      const std::shared_ptr<platform::NSXPCConnection>& connection) override;
+
+  // The master switch. On from the beginning; nothing in the service turns it off.
+  void setReportingEnabled(bool enabled);
+
+  [[nodiscard]] const Clients& getAllClients() const override { return clients_; }
+  [[nodiscard]] bool isReportingEnabled() const override;
+  [[nodiscard]] Sessions getAllActiveReportingSessions() const override;
+  [[nodiscard]] std::shared_ptr<HVReportingSession> findReportingSessionForID(
+      ReporterID reporterID) const override;
+  void removeClient(const HVReportingClientServerInstance& client) override;
+  [[nodiscard]] std::int64_t activeSessionCount() const override;
+  void setActiveSessionCount(std::int64_t count) override;
+  void noteSessionChange(const HVReportingClientServerInstance& client,
+                         const std::shared_ptr<HVReportingSession>& session,
+                         SessionChange change) override;
+
+ private:
+  using Client = std::shared_ptr<HVReportingClientServerInstance>;
+
+  Client exportClient(platform::NSXPCConnection& connection);
+  void registerClient(const Client& client);
+
+  // Taken while a connection is prepared and while a session is looked up across clients.
+  mutable std::recursive_mutex lock_;
+  Clients clients_;     // reporting queue only
+  SessionIndex index_;  // reporting queue only
+  // Single values that order with nothing.
+  std::atomic<bool> reportingEnabled_{true};
+  std::atomic<std::int64_t> activeSessionCount_{0};
+};
+
+}  // namespace halvox

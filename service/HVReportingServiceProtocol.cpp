@@ -1,0 +1,165 @@
+#include "service/HVReportingServiceProtocol.h"
+
+#include <algorithm>
+#include <array>
+#include <iterator>
+#include <string_view>
+#include <utility>
+
+namespace halvox {
+namespace {
+
+using platform::Array;
+using platform::Error;
+using platform::ExportedObject;
+using platform::InterfaceMethod;
+using platform::Invocation;
+using platform::MethodEffect;
+using platform::ReplyCallback;
+using platform::Value;
+
+constexpr std::string_view kInterfaceName = "com.tarno.halvox.HVReportingServiceProtocol";
+constexpr std::string_view kObjectPath = "/com/tarno/halvox/reporting";
+constexpr std::string_view kInvalidArguments = "org.freedesktop.DBus.Error.InvalidArgs";
+
+HVReportingServiceProtocol& service(ExportedObject& object) {
+  return static_cast<HVReportingServiceProtocol&>(object);
+}
+
+ReporterID reporterID(const Value& value) { return static_cast<ReporterID>(value.toInt64()); }
+
+// The arguments come with the types of the method's signature, so narrowing loses nothing.
+template <typename Enumeration>
+Enumeration enumeration(const Value& value) {
+  return static_cast<Enumeration>(value.toUInt64());
+}
+
+BoolReply boolReply(ReplyCallback&& reply) {
+  return [reply = std::move(reply)](const std::optional<Error>& error, bool value) {
+    reply(error, value);
+  };
+}
+
+ErrorReply errorReply(ReplyCallback&& reply) {
+  return [reply = std::move(reply)](const std::optional<Error>& error) { reply(error, Value()); };
+}
+
+std::vector<ReporterID> reporterIDs(const Array& numbers) {
+  std::vector<ReporterID> result;
+  result.reserve(numbers.size());
+  std::transform(numbers.begin(), numbers.end(), std::back_inserter(result), reporterID);
+  return result;
+}
+
+Array numbers(const std::vector<ReporterID>& reporters) {
+  std::vector<Value> values;
+  values.reserve(reporters.size());
+  for (const ReporterID reporter : reporters)
+    values.emplace_back(static_cast<std::int64_t>(reporter));
+  return Array(values);
+}
+
+void invokeCreate(ExportedObject& object, Invocation&& request) {
+  service(object).createReportingSession(reporterID(request.arguments[0]),
+                                         boolReply(std::move(request.reply)));
+}
+
+void invokeSetServiceType(ExportedObject& object, Invocation&& request) {
+  service(object).setServiceType(enumeration<AudioServiceType>(request.arguments[0]),
+                                 reporterID(request.arguments[1]),
+                                 boolReply(std::move(request.reply)));
+}
+
+void invokeGetServiceName(ExportedObject& object, Invocation&& request) {
+  service(object).getServiceNameForReporterID(
+      reporterID(request.arguments[0]),
+      [reply = std::move(request.reply)](const std::optional<Error>& error,
+                                         AudioServiceType serviceType) {
+        reply(error, static_cast<std::uint16_t>(serviceType));
+      });
+}
+
+void invokeSetConfiguration(ExportedObject& object, Invocation&& request) {
+  service(object).setConfiguration(request.arguments[0].dictionary(),
+                                   reporterID(request.arguments[1]),
+                                   boolReply(std::move(request.reply)));
+}
+
+void invokeStart(ExportedObject& object, Invocation&& request) {
+  service(object).startReportingSessionForID(reporterID(request.arguments[0]),
+                                             boolReply(std::move(request.reply)));
+}
+
+void invokeSendMessage(ExportedObject& object, Invocation&& request) {
+  // There is no null on the wire: the list comes inside another, which is empty for none.
+  const Array lists = request.arguments[3].array();
+  if (lists.size() > 1) {
+    request.reply(Error{.description = "reporter IDs: more than one list",
+                        .name = std::string(kInvalidArguments)},
+                  Value());
+    return;
+  }
+  HVReportingServiceProtocol::ReporterIDs reporters;
+  if (!lists.empty()) reporters = reporterIDs(lists[0].array());
+  service(object).sendMessage(request.arguments[0].dictionary(),
+                              enumeration<AudioEventCategory>(request.arguments[1]),
+                              enumeration<AudioEventType>(request.arguments[2]),
+                              std::move(reporters), errorReply(std::move(request.reply)));
+}
+
+void invokeStop(ExportedObject& object, Invocation&& request) {
+  service(object).stopReportingSessionForID(reporterID(request.arguments[0]),
+                                            boolReply(std::move(request.reply)));
+}
+
+void invokeDestroy(ExportedObject& object, Invocation&& request) {
+  service(object).destroyReportingSession(reporterID(request.arguments[0]),
+                                          boolReply(std::move(request.reply)));
+}
+
+void invokeReporterIDValid(ExportedObject& object, Invocation&& request) {
+  service(object).reporterIDValid(
+      reporterID(request.arguments[0]),
+      [reply = std::move(request.reply)](const std::optional<Error>& error,
+                                         const platform::Dictionary& dictionary) {
+        reply(error, dictionary);
+      });
+}
+
+void invokeGetAllReporters(ExportedObject& object, Invocation&& request) {
+  service(object).getAllReporters(
+      [reply = std::move(request.reply)](const std::optional<Error>& error,
+                                         const std::vector<ReporterID>& reporters) {
+        reply(error, numbers(reporters));
+      });
+}
+
+void invokeKillService(ExportedObject& object, Invocation&& request) {
+  service(object).killService(boolReply(std::move(request.reply)));
+}
+
+constexpr MethodEffect kMore = MethodEffect::kMayHoldMore;
+constexpr MethodEffect kNoMore = MethodEffect::kHoldsNoMore;
+
+constexpr std::array kMethods{
+    InterfaceMethod{"createReportingSession", "x", "b", kMore, invokeCreate},
+    InterfaceMethod{"setServiceType", "qx", "b", kNoMore, invokeSetServiceType},
+    InterfaceMethod{"getServiceNameForReporterID", "x", "q", kNoMore, invokeGetServiceName},
+    InterfaceMethod{"setConfiguration", "a{sv}x", "b", kMore, invokeSetConfiguration},
+    InterfaceMethod{"startReportingSessionForID", "x", "b", kMore, invokeStart},
+    InterfaceMethod{"sendMessage", "a{sv}uqaax", "", kMore, invokeSendMessage},
+    InterfaceMethod{"stopReportingSessionForID", "x", "b", kNoMore, invokeStop},
+    InterfaceMethod{"destroyReportingSession", "x", "b", kNoMore, invokeDestroy},
+    InterfaceMethod{"reporterIDValid", "x", "a{sv}", kNoMore, invokeReporterIDValid},
+    InterfaceMethod{"getAllReporters", "", "ax", kNoMore, invokeGetAllReporters},
+    InterfaceMethod{"killService", "", "b", kNoMore, invokeKillService},
+};
+
+}  // namespace
+
+const platform::NSXPCInterface& HVReportingServiceInterface() {
+  static constexpr platform::NSXPCInterface kInterface{kInterfaceName, kObjectPath, kMethods};
+  return kInterface;
+}
+
+}  // namespace halvox
