@@ -1,0 +1,53 @@
+#include <cstddef>
+#include <memory>
+
+#include <gtest/gtest.h>
+
+#include "backends/HVReportingTallyhubBridge.h"
+#include "platform/analytics.h"
+#include "platform/fake/AllocationCounter.h"
+#include "platform/fake/FakePlatform.h"
+#include "platform/services.h"
+#include "session/HVReportingSession.h"
+
+namespace halvox {
+namespace {
+
+// Nobody collects anything, and asking costs nothing.
+class UnusedAnalyticsService final : public platform::AnalyticsService {
+ public:
+  bool isAnalyticsEventUsed(std::string_view /*eventName*/) override {
+    ++asked;
+    return false;
+  }
+  void sendAnalyticsEventLazy(std::string /*eventName*/,
+                              platform::AnalyticsPayloadBuilder /*builder*/) override {
+    ++sent;
+  }
+  int asked = 0;
+  int sent = 0;
+};
+
+TEST(HVReportingTallyhubBridgeAllocationTest, AMessageThatNobodyCollectsAllocatesNothing) {
+  platform::FakePlatform fakes;
+  UnusedAnalyticsService analytics;
+  platform::installServices({analytics, fakes.clock, fakes.connections, fakes.deviceProperties,
+                             fakes.dispatch, fakes.featureFlags, fakes.kdebug, fakes.log,
+                             fakes.process, fakes.statistics});
+  const auto session = std::make_shared<HVReportingSession>(
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
+  const platform::Message message = platform::Dictionary{{"a", 1}};
+
+  const std::size_t before = platform::allocationsOfThisThread();
+  ASSERT_GT(before, 0U);  // the counter works
+  HVReportingTallyhubBridge::handleEvent(
+      message, AudioEventCategory::kSession | AudioEventCategory::kPlaybackAndRecord,
+      AudioEventType::kHeadphoneAudioExposure, session);
+
+  EXPECT_EQ(platform::allocationsOfThisThread() - before, 0U);
+  EXPECT_EQ(analytics.asked, 2);
+  EXPECT_EQ(analytics.sent, 0);
+}
+
+}  // namespace
+}  // namespace halvox

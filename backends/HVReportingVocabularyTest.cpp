@@ -1,0 +1,56 @@
+#include "backends/HVReportingVocabulary.h"
+
+#include <type_traits>
+
+#include <gtest/gtest.h>
+
+#include "platform/fake/FakePlatform.h"
+#include "platform/log.h"
+
+namespace halvox {
+namespace {
+
+using platform::FakeLogService;
+using platform::LogCategory;
+using platform::LogLevel;
+
+class HVReportingVocabularyTest : public testing::Test {
+ protected:
+  // The subsystem and category of a line that is written to that category, joined with a slash.
+  std::string namesOf(LogCategory& category) {
+    category.write(LogLevel::kError, "");
+    const FakeLogService::Line line = platform_.log.lines().back();
+    return line.subsystem + "/" + line.category;
+  }
+
+  platform::FakePlatform platform_;
+};
+
+TEST_F(HVReportingVocabularyTest, LogCategoriesHaveTheirNamesInTheSubsystem) {
+  EXPECT_EQ(namesOf(HVReportingClientCategory()), "com.tarno.halvox/hvrc");
+  EXPECT_EQ(namesOf(HVReportingServiceDelegateCategory()), "com.tarno.halvox/hvrs");
+  EXPECT_EQ(namesOf(HVReportingSessionCategory()), "com.tarno.halvox/hvrr");
+  EXPECT_EQ(namesOf(HVReportingSessionTLMReportingCategory()), "com.tarno.halvox/hvri");
+}
+
+TEST_F(HVReportingVocabularyTest, LogCategoriesAreMadeOnce) {
+  EXPECT_EQ(&HVReportingClientCategory(), &HVReportingClientCategory());
+  EXPECT_EQ(&HVReportingServiceDelegateCategory(), &HVReportingServiceDelegateCategory());
+  EXPECT_EQ(&HVReportingSessionCategory(), &HVReportingSessionCategory());
+  EXPECT_EQ(&HVReportingSessionTLMReportingCategory(), &HVReportingSessionTLMReportingCategory());
+}
+
+TEST_F(HVReportingVocabularyTest, DomainAndCategoryAreJoinedBitwise) {
+  constexpr auto kCategory = AudioEventCategory::kSession | AudioEventCategory::kPlayback;
+
+  EXPECT_EQ(static_cast<std::uint32_t>(kCategory), 0x08000004U);
+}
+
+TEST_F(HVReportingVocabularyTest, IdentifiersAreNotInterchangeableWithNumbers) {
+  EXPECT_FALSE((std::is_convertible_v<std::int64_t, ReporterID>));
+  EXPECT_FALSE((std::is_convertible_v<ReporterID, std::int64_t>));
+  EXPECT_EQ(kNoReporterID, ReporterID{0});
+}
+
+}  // namespace
+}  // namespace halvox

@@ -1,0 +1,55 @@
+#pragma once
+
+#include <chrono>
+
+#include <gtest/gtest.h>
+
+#include "platform/clock.h"
+
+namespace halvox::platform::contract {
+
+// What every ClockService promises.
+//
+// `Harness` is default-constructible and has
+//   ClockService& service();
+//   void letPass(std::chrono::milliseconds time);  at least that much
+template <typename Harness>
+class ClockContract : public ::testing::Test {
+ protected:
+  Harness harness_;
+};
+TYPED_TEST_SUITE_P(ClockContract);
+
+TYPED_TEST_P(ClockContract, UptimesMoveOnWithTime) {
+  const ClockService& clock = this->harness_.service();
+  const auto system = clock.systemUptime();
+  const auto process = clock.processUptime();
+
+  this->harness_.letPass(std::chrono::milliseconds(20));
+
+  // Not so the date: somebody may set it back at any time.
+  EXPECT_GE(clock.systemUptime() - system, std::chrono::milliseconds(19));
+  EXPECT_GE(clock.processUptime() - process, std::chrono::milliseconds(19));
+}
+
+TYPED_TEST_P(ClockContract, ProcessHasNotRunLongerThanTheSystem) {
+  const ClockService& clock = this->harness_.service();
+
+  EXPECT_GE(clock.processUptime(), std::chrono::milliseconds(0));
+  EXPECT_LE(clock.processUptime(), clock.systemUptime());
+}
+
+TYPED_TEST_P(ClockContract, DateIsOfThisCentury) {
+  constexpr double kStartOf2020 = 1'577'836'800;
+  constexpr double kStartOf2100 = 4'102'444'800;
+
+  const Date date = this->harness_.service().currentDate();
+
+  EXPECT_GT(date.secondsSince1970, kStartOf2020);
+  EXPECT_LT(date.secondsSince1970, kStartOf2100);
+}
+
+REGISTER_TYPED_TEST_SUITE_P(ClockContract, UptimesMoveOnWithTime,
+                            ProcessHasNotRunLongerThanTheSystem, DateIsOfThisCentury);
+
+}  // namespace halvox::platform::contract
