@@ -117,6 +117,8 @@ Value::Value(Value&& other) noexcept {
   other.setTag(Tag::kNone);
 }
 
+// Retaining before releasing makes assigning a value to itself harmless.
+// NOLINTNEXTLINE(bugprone-unhandled-self-assignment)
 Value& Value::operator=(const Value& other) noexcept {
   other.retain();
   release();

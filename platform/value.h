@@ -53,10 +53,9 @@ struct DictionaryRep;
 // finds no place in it works the same and owns its text. Any thread may make and copy keys.
 class Key {
  public:
-  Key(std::string_view text);  // NOLINT(google-explicit-constructor): keys are written as texts
-  Key(const char* text) : Key(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
-  Key(const std::string& text)
-      : Key(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
+  Key(std::string_view text);
+  Key(const char* text) : Key(std::string_view(text)) {}
+  Key(const std::string& text) : Key(std::string_view(text)) {}
   Key(const Key& other) noexcept;
   Key(Key&& other) noexcept : node_(std::exchange(other.node_, nullptr)) {}
   Key& operator=(Key other) noexcept {
@@ -118,6 +117,10 @@ enum class NumberKind : std::uint8_t {
   kDouble,
 };
 
+// What a number can be made from.
+template <typename Number>
+concept ArithmeticNumber = std::integral<Number> || std::floating_point<Number>;
+
 enum class ValueKind : std::uint8_t { kNone, kNumber, kString, kDate, kData, kArray, kDictionary };
 
 // One property-list value: a number, a string, a date, data, an array or a dictionary.
@@ -134,18 +137,16 @@ enum class ValueKind : std::uint8_t { kNone, kNumber, kString, kDate, kData, kAr
 class Value {
  public:
   Value() noexcept = default;  // no value at all; equal only to another such
-  template <typename Number>
-  requires std::integral<Number> || std::floating_point<Number> Value(Number number)
-  noexcept;                      // NOLINT(google-explicit-constructor): plain data
-  Value(std::string_view text);  // NOLINT(google-explicit-constructor)
-  Value(const char* text) : Value(std::string_view(text)) {}  // NOLINT(google-explicit-constructor)
-  Value(const std::string& text)
-      : Value(std::string_view(text)) {}           // NOLINT(google-explicit-constructor)
-  Value(const StringConstant& constant) noexcept;  // NOLINT(google-explicit-constructor)
-  Value(Date date) noexcept;                       // NOLINT(google-explicit-constructor)
-  Value(Data data) noexcept;                       // NOLINT(google-explicit-constructor)
-  Value(Array array) noexcept;                     // NOLINT(google-explicit-constructor)
-  Value(Dictionary dictionary) noexcept;           // NOLINT(google-explicit-constructor)
+  template <ArithmeticNumber Number>
+  Value(Number number) noexcept;
+  Value(std::string_view text);
+  Value(const char* text) : Value(std::string_view(text)) {}
+  Value(const std::string& text) : Value(std::string_view(text)) {}
+  Value(const StringConstant& constant) noexcept;
+  Value(Date date) noexcept;
+  Value(Data data) noexcept;
+  Value(Array array) noexcept;
+  Value(Dictionary dictionary) noexcept;
   Value(const Value& other) noexcept;
   Value(Value&& other) noexcept;
   Value& operator=(const Value& other) noexcept;
@@ -329,9 +330,8 @@ std::string describe(const Value& value);
 std::string describe(const Dictionary& dictionary);
 std::string describe(const Message& message);
 
-template <typename Number>
-requires std::integral<Number> || std::floating_point<Number> Value::Value(Number number)
-noexcept {
+template <ArithmeticNumber Number>
+Value::Value(Number number) noexcept {
   if constexpr (std::same_as<Number, bool>) {
     setNumber(NumberKind::kBool, static_cast<std::uint64_t>(number));
   } else if constexpr (std::same_as<Number, float>) {

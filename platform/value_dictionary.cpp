@@ -169,7 +169,9 @@ void Dictionary::merge(const Dictionary& other) {
     *this = other;
     return;
   }
-  const Dictionary source = other;  // keeps the entries where they are if `other` is this one
+  // Keeps the entries where they are if `other` is this one.
+  // NOLINTNEXTLINE(performance-unnecessary-copy-initialization)
+  const Dictionary source = other;
   for (const Entry& entry : source) set(entry.key, entry.value);
 }
 
