@@ -221,7 +221,7 @@ FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrame
 std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame) {
   const FrameMeasure measure = measureFrame(frame, kMaxMessageBytes);
   if (measure.state == FrameMeasure::State::kBroken) return measure.error;
-  if (measure.totalBytes != frame.size()) {
+  if (measure.state != FrameMeasure::State::kKnown || measure.totalBytes != frame.size()) {
     return WireError{"not the size that the header tells", frame.size()};
   }
   MessageHeader header;

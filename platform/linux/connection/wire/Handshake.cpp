@@ -69,7 +69,7 @@ bool HandshakeLine::take(std::span<const std::byte>& input) {
   std::size_t taken = 0;
   while (!complete_ && taken < input.size() && !isTooLong()) {
     line_ += std::to_integer<char>(input[taken++]);
-    complete_ = line_.ends_with(kLineEnd);
+    complete_ = !isTooLong() && line_.ends_with(kLineEnd);
   }
   input = input.subspan(taken);
   return complete_;
