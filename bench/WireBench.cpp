@@ -1,0 +1,75 @@
+// What reading a message from the wire and answering it costs, piece by piece.
+
+#include <algorithm>
+#include <string>
+#include <vector>
+
+#include <benchmark/benchmark.h>
+
+#include "platform/linux/connection/wire/Frame.h"
+#include "platform/linux/connection/wire/FrameWriter.h"
+#include "platform/linux/connection/wire/ValueDecoder.h"
+#include "platform/linux/connection/wire/testdata/GoldenFrames.h"
+#include "platform/linux/connection/wire/testdata/TestFrames.h"
+
+namespace halvox::platform::linux_::dbus {
+namespace {
+
+// A message of ten fields, as clients send them.
+std::string sendMessageFrame(bool bigEndian) {
+  const auto* golden = std::ranges::find_if(kGoldenFrames, [&](const GoldenFrame& frame) {
+    return frame.name == "send_message" && frame.bigEndian == bigEndian;
+  });
+  return fromHex(golden->hex);
+}
+
+void measureHeader(benchmark::State& state) {
+  const std::string bytes = sendMessageFrame(false);
+  for (auto _ : state) benchmark::DoNotOptimize(measureFrame(asBytes(bytes), kMaxMessageBytes));
+}
+BENCHMARK(measureHeader);
+
+void readHeader(benchmark::State& state) {
+  const std::string bytes = sendMessageFrame(false);
+  for (auto _ : state) benchmark::DoNotOptimize(readFrame(asBytes(bytes)));
+}
+BENCHMARK(readHeader);
+
+// The whole way from the bytes to the values, and the end of these.
+void readAndDecodeTenFields(benchmark::State& state) {
+  const std::string bytes = sendMessageFrame(state.range(0) == 1);
+  std::vector<Value> arguments;
+  for (auto _ : state) {
+    const auto result = readFrame(asBytes(bytes));
+    const auto error = decodeBody(std::get<Frame>(result), "a{sv}uqaax", arguments);
+    if (error.has_value()) state.SkipWithError(error->message.c_str());
+    benchmark::DoNotOptimize(arguments.data());
+  }
+  state.SetBytesProcessed(static_cast<std::int64_t>(bytes.size()) * state.iterations());
+}
+BENCHMARK(readAndDecodeTenFields)->ArgName("big_endian")->Arg(0)->Arg(1);
+
+void writeBooleanReply(benchmark::State& state) {
+  std::string out;
+  for (auto _ : state) {
+    out.clear();
+    benchmark::DoNotOptimize(appendMethodReturn(out, {1, {}}, 2, "b", true));
+  }
+}
+BENCHMARK(writeBooleanReply);
+
+void writeDictionaryReply(benchmark::State& state) {
+  const std::string bytes = sendMessageFrame(false);
+  std::vector<Value> arguments;
+  const auto result = readFrame(asBytes(bytes));
+  if (decodeBody(std::get<Frame>(result), "a{sv}uqaax", arguments)) state.SkipWithError("frame");
+  std::string out;
+  for (auto _ : state) {
+    out.clear();
+    benchmark::DoNotOptimize(appendMethodReturn(out, {1, {}}, 2, "a{sv}", arguments.front()));
+  }
+}
+BENCHMARK(writeDictionaryReply);
+
+}  // namespace
+}  // namespace halvox::platform::linux_::dbus
