@@ -1,6 +1,5 @@
 #include "platform/linux/runtime/AsioDispatchService.h"
 
-#include <source_location>
 #include <string>
 #include <system_error>
 #include <utility>
@@ -70,10 +69,9 @@ std::shared_ptr<DispatchQueue> AsioDispatchService::createOwnThreadQueue(std::st
     DispatchQueue* const face = queue.get();
     return {face, [queue = std::move(queue)](DispatchQueue*) { queue->close(); }};
   } catch (const std::system_error& error) {
-    log_.write(LogLevel::kError,
-               detail::logPrefix("AsioDispatchService", std::source_location::current().line()) +
-                   "no thread for queue " + std::string(label) +
-                   ", it uses the pool: " + error.what());
+    log_.write(LogLevel::kError, detail::logPrefix("AsioDispatchService", __LINE__) +
+                                     "no thread for queue " + std::string(label) +
+                                     ", it uses the pool: " + error.what());
     return nullptr;
   }
 }

@@ -1,7 +1,6 @@
 #include "platform/linux/runtime/JobRunner.h"
 
 #include <exception>
-#include <source_location>
 #include <string>
 
 namespace halvox::platform::linux_ {
@@ -22,8 +21,7 @@ void JobRunner::reportFailure() noexcept {
     // Nothing more is known about it.
   }
   log_.write(LogLevel::kError,
-             detail::logPrefix("JobRunner", std::source_location::current().line()) +
-                 "a job failed with an exception: " + what);
+             detail::logPrefix("JobRunner", __LINE__) + "a job failed with an exception: " + what);
 }
 
 }  // namespace halvox::platform::linux_

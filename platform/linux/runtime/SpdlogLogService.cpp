@@ -1,6 +1,5 @@
 #include "platform/linux/runtime/SpdlogLogService.h"
 
-#include <source_location>
 #include <vector>
 
 #include <systemd/sd-journal.h>
@@ -52,6 +51,8 @@ std::unique_ptr<SpdlogLogService> SpdlogLogService::onStandardError(LogLevel thr
   return std::make_unique<SpdlogLogService>(threshold, std::move(sink), statistics);
 }
 
+SpdlogLogService::~SpdlogLogService() { stop(); }
+
 LogCategory& SpdlogLogService::createCategory(std::string_view subsystem,
                                               std::string_view category) {
   std::pair<std::string, std::string> names(subsystem, category);
@@ -89,8 +90,8 @@ void SpdlogLogService::run() {
 void SpdlogLogService::reportLosses() {
   const std::uint64_t lost = unreported_.exchange(0, std::memory_order_relaxed);
   if (lost == 0) return;
-  std::string text = detail::logPrefix("SpdlogLogService", std::source_location::current().line()) +
-                     std::to_string(lost) + " lines were dropped: the log is read too slowly";
+  std::string text = detail::logPrefix("SpdlogLogService", __LINE__) + std::to_string(lost) +
+                     " lines were dropped: the log is read too slowly";
   const std::size_t length = text.size();
   const LogEntry entry{.time = std::chrono::system_clock::now(),
                        .level = LogLevel::kError,

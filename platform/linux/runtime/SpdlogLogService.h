@@ -32,7 +32,7 @@ class SpdlogLogService final : public LogService {
   // To standard error, or to the journal when that is where standard error goes.
   static std::unique_ptr<SpdlogLogService> onStandardError(LogLevel threshold,
                                                            StatisticsService& statistics);
-  ~SpdlogLogService() override { stop(); }
+  ~SpdlogLogService() override;
 
   LogCategory& createCategory(std::string_view subsystem, std::string_view category) override;
 
