@@ -1,0 +1,68 @@
+#include "reporters/pipewire/MainLoop.h"
+
+#include <array>
+#include <csignal>
+#include <stdexcept>
+#include <utility>
+#include <vector>
+
+#include <pipewire/pipewire.h>
+
+namespace halvox::pipewire_reporter {
+
+class MainLoop::Impl {
+ public:
+  Impl() {
+    pw_init(nullptr, nullptr);
+    loop_ = pw_main_loop_new(nullptr);
+    if (loop_ == nullptr) {
+      pw_deinit();
+      throw std::runtime_error("cannot make the event loop");
+    }
+    // A signal that is blocked here is blocked in every thread made later, and so comes to the
+    // loop.
+    for (const int number : {SIGTERM, SIGINT}) {
+      pw_loop_add_signal(handle(), number, &Impl::onSignal, this);
+    }
+  }
+  ~Impl() {
+    pw_main_loop_destroy(loop_);
+    pw_deinit();
+  }
+  Impl(const Impl&) = delete;
+  Impl& operator=(const Impl&) = delete;
+
+  [[nodiscard]] pw_loop* handle() const { return pw_main_loop_get_loop(loop_); }
+  void run() { pw_main_loop_run(loop_); }
+  void quit() { pw_main_loop_quit(loop_); }
+
+  std::function<void()> makeNotifier(std::function<void()> call) {
+    calls_.push_back(std::make_unique<std::function<void()>>(std::move(call)));
+    spa_source* source = pw_loop_add_event(handle(), &Impl::onEvent, calls_.back().get());
+    if (source == nullptr) {
+      throw std::runtime_error("cannot make an event");
+    }
+    return [loop = handle(), source] { pw_loop_signal_event(loop, source); };
+  }
+
+ private:
+  static void onSignal(void* data, int /*number*/) { static_cast<Impl*>(data)->quit(); }
+  static void onEvent(void* data, std::uint64_t /*count*/) {
+    (*static_cast<std::function<void()>*>(data))();
+  }
+
+  pw_main_loop* loop_ = nullptr;
+  std::vector<std::unique_ptr<std::function<void()>>> calls_;
+};
+
+MainLoop::MainLoop() : impl_(std::make_unique<Impl>()) {}
+MainLoop::~MainLoop() = default;
+void MainLoop::run() { impl_->run(); }
+void MainLoop::quit() { impl_->quit(); }
+pw_loop* MainLoop::handle() const { return impl_->handle(); }
+
+std::function<void()> MainLoop::makeNotifier(std::function<void()> call) {
+  return impl_->makeNotifier(std::move(call));
+}
+
+}  // namespace halvox::pipewire_reporter

@@ -1,0 +1,301 @@
+#include "reporters/pipewire/PipeWireSource.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <ctime>
+#include <stdexcept>
+#include <unordered_map>
+#include <utility>
+
+#include <fmt/format.h>
+#include <pipewire/pipewire.h>
+
+#include "reporters/pipewire/ObjectBinding.h"
+#include "reporters/pipewire/ParamDecoder.h"
+
+namespace halvox::pipewire_reporter {
+namespace {
+
+using std::chrono::milliseconds;
+constexpr milliseconds kReconnectSoon{1};
+constexpr milliseconds kReconnectMin{100};
+constexpr milliseconds kReconnectMax{5000};
+constexpr std::string_view kClientIDProperty = "client.id";
+constexpr std::string_view kSerialProperty = "object.serial";
+
+struct ContextDeleter {
+  void operator()(pw_context* context) const { pw_context_destroy(context); }
+};
+struct CoreDeleter {
+  void operator()(pw_core* core) const { pw_core_disconnect(core); }
+};
+struct RegistryDeleter {
+  void operator()(pw_registry* registry) const {
+    pw_proxy_destroy(reinterpret_cast<pw_proxy*>(registry));
+  }
+};
+
+// The number under a key, or 0 when there is none that fits.
+GlobalID idProperty(const Properties& properties, std::string_view key) {
+  const auto number = parseNumber(property(properties, key)).value_or(0);
+  return number <= UINT32_MAX ? static_cast<GlobalID>(number) : 0;
+}
+
+// A stream's own properties, and behind them what its client says about the application.
+Properties withClient(const Properties& stream, const Properties& client) {
+  Properties all = stream;
+  for (const auto& [key, value] : client) {
+    if (key.starts_with("application.") || key == "client.api") {
+      all.emplace(key, value);
+    }
+  }
+  // What the server knows of the process at the other end of the socket.
+  if (const auto pid = property(client, "pipewire.sec.pid"); !pid.empty()) {
+    all.emplace("application.process.id", pid);
+  }
+  return all;
+}
+
+}  // namespace
+
+// The timer and the callbacks run on the loop thread; a callback of an object may destroy other
+// objects, never its own.
+class PipeWireSource::Impl final : public StreamListener {
+ public:
+  Impl(pw_loop* loop, StreamTracker& tracker, Options options)
+      : loop_(loop), tracker_(tracker), options_(std::move(options)) {
+    context_.reset(pw_context_new(loop, nullptr, 0));
+    retry_ = pw_loop_add_timer(loop, &Impl::onRetry, this);
+    if (context_ == nullptr || retry_ == nullptr) {
+      throw std::runtime_error(fmt::format("cannot set up PipeWire's library: {}",
+                                           std::generic_category().message(errno)));
+    }
+    connect();
+  }
+  ~Impl() override {
+    disconnect();
+    pw_loop_destroy_source(loop_, retry_);
+  }
+
+ private:
+  void connect();
+  void disconnect();
+  void retryAfter(milliseconds pause);
+  void addNode(GlobalID id, const Properties& properties);
+  void addLink(GlobalID id, const Properties& properties);
+  void removeGlobal(GlobalID id);
+  void clientChanged(GlobalID id);
+  [[nodiscard]] Properties fullProperties(const Properties& stream) const;
+
+  void onStreamProperties(GlobalID id, const Properties& properties) override;
+  void onStreamState(GlobalID id, pw_node_state state) override;
+  void onStreamParam(GlobalID id, std::uint32_t param, const spa_pod* value) override;
+
+  static void onRetry(void* data, std::uint64_t expirations);
+  static void onCoreInfo(void* data, const pw_core_info* info);
+  static void onCoreError(void* data, std::uint32_t id, int sequence, int result,
+                          const char* message);
+  static void onGlobal(void* data, std::uint32_t id, std::uint32_t permissions, const char* type,
+                       std::uint32_t version, const spa_dict* dict);
+  static void onGlobalRemove(void* data, std::uint32_t id);
+
+  struct Stream {
+    Properties announced;  // what the server said of it to everybody
+    bool told = false;     // the tracker knows it
+    std::unique_ptr<StreamBinding> binding;
+  };
+
+  pw_loop* loop_;
+  StreamTracker& tracker_;
+  Options options_;
+  spa_source* retry_ = nullptr;
+  milliseconds pause_ = kReconnectMin;
+  bool connected_ = false;
+  bool waitingTold_ = false;
+  std::unique_ptr<pw_context, ContextDeleter> context_;
+  std::unique_ptr<pw_core, CoreDeleter> core_;
+  std::unique_ptr<pw_registry, RegistryDeleter> registry_;
+  spa_hook coreHook_{};
+  spa_hook registryHook_{};
+  std::unordered_map<GlobalID, Stream> streams_;
+  std::unordered_map<GlobalID, std::unique_ptr<ClientBinding>> clients_;
+};
+
+void PipeWireSource::Impl::connect() {
+  static const pw_core_events kCoreEvents = [] {
+    pw_core_events events{};
+    events.version = PW_VERSION_CORE_EVENTS;
+    events.info = &Impl::onCoreInfo;
+    events.error = &Impl::onCoreError;
+    return events;
+  }();
+  static const pw_registry_events kRegistryEvents = {.version = PW_VERSION_REGISTRY_EVENTS,
+                                                     .global = &Impl::onGlobal,
+                                                     .global_remove = &Impl::onGlobalRemove};
+  pw_properties* properties =
+      pw_properties_new(PW_KEY_APP_NAME, "halvox-pipewire-reporter", nullptr);
+  if (!options_.remote.empty()) {
+    pw_properties_set(properties, PW_KEY_REMOTE_NAME, options_.remote.c_str());
+  }
+  core_.reset(pw_context_connect(context_.get(), properties, 0));
+  if (core_ == nullptr) {
+    if (!std::exchange(waitingTold_, true)) {
+      options_.log(fmt::format("waiting for PipeWire: {}", std::generic_category().message(errno)));
+    }
+    retryAfter(pause_);
+    pause_ = std::min(pause_ * 2, kReconnectMax);
+    return;
+  }
+  pw_core_add_listener(core_.get(), &coreHook_, &kCoreEvents, this);
+  registry_.reset(pw_core_get_registry(core_.get(), PW_VERSION_REGISTRY, 0));
+  pw_registry_add_listener(registry_.get(), &registryHook_, &kRegistryEvents, this);
+}
+
+void PipeWireSource::Impl::disconnect() {
+  if (core_ == nullptr) {
+    return;
+  }
+  streams_.clear();
+  clients_.clear();
+  spa_hook_remove(&registryHook_);
+  registry_.reset();
+  spa_hook_remove(&coreHook_);
+  core_.reset();
+  connected_ = false;
+  tracker_.serverLost();
+}
+
+void PipeWireSource::Impl::retryAfter(milliseconds pause) {
+  const auto seconds = std::chrono::floor<std::chrono::seconds>(pause);
+  timespec value{.tv_sec = seconds.count(),
+                 .tv_nsec = std::chrono::nanoseconds(pause - seconds).count()};
+  pw_loop_update_timer(loop_, retry_, &value, nullptr, false);
+}
+
+void PipeWireSource::Impl::addNode(GlobalID id, const Properties& properties) {
+  if (!streamDirection(property(properties, PW_KEY_MEDIA_CLASS))) {
+    tracker_.nodeAdded({.id = id,
+                        .serial = idProperty(properties, kSerialProperty),
+                        .mediaClass = std::string(property(properties, PW_KEY_MEDIA_CLASS)),
+                        .properties = properties});
+    return;
+  }
+  Stream& stream = streams_[id];
+  stream.announced = properties;
+  stream.told = false;
+  stream.binding = std::make_unique<StreamBinding>(registry_.get(), id, *this);
+}
+
+void PipeWireSource::Impl::addLink(GlobalID id, const Properties& properties) {
+  tracker_.linkAdded(id, {.output = idProperty(properties, PW_KEY_LINK_OUTPUT_NODE),
+                          .input = idProperty(properties, PW_KEY_LINK_INPUT_NODE)});
+}
+
+void PipeWireSource::Impl::removeGlobal(GlobalID id) {
+  streams_.erase(id);
+  clients_.erase(id);
+  tracker_.linkRemoved(id);
+  tracker_.nodeRemoved(id);
+}
+
+void PipeWireSource::Impl::clientChanged(GlobalID id) {
+  for (const auto& [streamID, stream] : streams_) {
+    if (stream.told && idProperty(stream.binding->properties(), kClientIDProperty) == id) {
+      tracker_.streamPropertiesChanged(streamID, fullProperties(stream.binding->properties()));
+    }
+  }
+}
+
+Properties PipeWireSource::Impl::fullProperties(const Properties& stream) const {
+  const auto client = clients_.find(idProperty(stream, kClientIDProperty));
+  return client == clients_.end() ? stream : withClient(stream, client->second->properties());
+}
+
+void PipeWireSource::Impl::onStreamProperties(GlobalID id, const Properties& properties) {
+  const auto found = streams_.find(id);
+  if (found == streams_.end()) {
+    return;
+  }
+  Stream& stream = found->second;
+  const Properties all = fullProperties(properties);
+  if (std::exchange(stream.told, true)) {
+    tracker_.streamPropertiesChanged(id, all);
+    return;
+  }
+  // Class and serial as the server announced them: the stream's client can change its own copy.
+  tracker_.nodeAdded({.id = id,
+                      .serial = idProperty(stream.announced, kSerialProperty),
+                      .mediaClass = std::string(property(stream.announced, PW_KEY_MEDIA_CLASS)),
+                      .properties = all});
+}
+
+void PipeWireSource::Impl::onStreamState(GlobalID id, pw_node_state state) {
+  tracker_.streamRunningChanged(id, state == PW_NODE_STATE_RUNNING);
+}
+
+void PipeWireSource::Impl::onStreamParam(GlobalID id, std::uint32_t param, const spa_pod* value) {
+  if (param == SPA_PARAM_Format) {
+    if (const auto format = decodeFormat(value)) {
+      tracker_.streamFormatChanged(id, *format);
+    }
+  } else if (param == SPA_PARAM_Props) {
+    tracker_.streamVolumeChanged(id, decodeVolume(value));
+  }
+}
+
+void PipeWireSource::Impl::onRetry(void* data, std::uint64_t /*expirations*/) {
+  auto* self = static_cast<Impl*>(data);
+  self->disconnect();
+  self->connect();
+}
+
+void PipeWireSource::Impl::onCoreInfo(void* data, const pw_core_info* info) {
+  auto* self = static_cast<Impl*>(data);
+  if (!std::exchange(self->connected_, true)) {
+    self->pause_ = kReconnectMin;
+    self->waitingTold_ = false;
+    self->options_.log(fmt::format("following PipeWire {} ({})", info->version, info->name));
+    self->tracker_.serverConnected(info->cookie);
+  }
+}
+
+void PipeWireSource::Impl::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
+                                       const char* message) {
+  auto* self = static_cast<Impl*>(data);
+  if (id != PW_ID_CORE || result != -EPIPE) {
+    // An object that went before it could be asked is no news; anything else may be.
+    if (result != -ENOENT) {
+      self->options_.log(fmt::format("PipeWire refused: {} (object {})", message, id));
+    }
+    return;
+  }
+  self->options_.log("PipeWire has gone");
+  // From the timer, because the connection cannot be closed from within its own callback.
+  self->retryAfter(kReconnectSoon);
+}
+
+void PipeWireSource::Impl::onGlobal(void* data, std::uint32_t id, std::uint32_t /*permissions*/,
+                                    const char* type, std::uint32_t /*version*/,
+                                    const spa_dict* dict) {
+  auto* self = static_cast<Impl*>(data);
+  const std::string_view kind = type;
+  if (kind == PW_TYPE_INTERFACE_Node) {
+    self->addNode(id, makeProperties(dict));
+  } else if (kind == PW_TYPE_INTERFACE_Link) {
+    self->addLink(id, makeProperties(dict));
+  } else if (kind == PW_TYPE_INTERFACE_Client) {
+    self->clients_[id] = std::make_unique<ClientBinding>(self->registry_.get(), id,
+                                                         [self, id] { self->clientChanged(id); });
+  }
+}
+
+void PipeWireSource::Impl::onGlobalRemove(void* data, std::uint32_t id) {
+  static_cast<Impl*>(data)->removeGlobal(id);
+}
+
+PipeWireSource::PipeWireSource(pw_loop* loop, StreamTracker& tracker, Options options)
+    : impl_(std::make_unique<Impl>(loop, tracker, std::move(options))) {}
+PipeWireSource::~PipeWireSource() = default;
+
+}  // namespace halvox::pipewire_reporter

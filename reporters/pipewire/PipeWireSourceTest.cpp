@@ -1,0 +1,169 @@
+#include "reporters/pipewire/PipeWireSource.h"
+
+#include <chrono>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <pipewire/pipewire.h>
+
+#include "reporters/pipewire/MainLoop.h"
+#include "reporters/pipewire/PrivatePipeWire.h"
+#include "reporters/pipewire/RecordingReportingClient.h"
+
+namespace halvox::pipewire_reporter {
+namespace {
+
+using std::chrono::steady_clock;
+constexpr std::chrono::seconds kDeadline{30};
+
+// Real streams of a private PipeWire, and what the reporter makes of them.
+class PipeWireSourceTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    if (const auto missing = PrivatePipeWire::missingTools(); !missing.empty()) {
+      GTEST_SKIP() << missing;
+    }
+    audio = std::make_unique<PrivatePipeWire>();
+    ASSERT_TRUE(audio->isReady());
+    loop = std::make_unique<MainLoop>();
+    pw_loop_enter(loop->handle());
+    source = std::make_unique<PipeWireSource>(
+        loop->handle(), tracker,
+        PipeWireSource::Options{.remote = {},
+                                .log = [this](std::string_view line) { log.emplace_back(line); }});
+  }
+  void TearDown() override {
+    source.reset();
+    if (loop != nullptr) {
+      pw_loop_leave(loop->handle());
+    }
+  }
+
+  // Runs the loop until that operation has come `count` times, or the deadline.
+  [[nodiscard]] bool waitFor(const std::string& operation, long count = 1) const {
+    return waitUntil([&] { return std::ranges::count(client.operations(), operation) >= count; });
+  }
+  template <typename Condition>
+  [[nodiscard]] bool waitUntil(Condition condition) const {
+    const auto end = steady_clock::now() + kDeadline;
+    while (!condition()) {
+      if (steady_clock::now() > end) {
+        return false;
+      }
+      pw_loop_iterate(loop->handle(), 100);
+    }
+    return true;
+  }
+  [[nodiscard]] ChildProcess play(double seconds, const std::string& role = "Music") const {
+    return ChildProcess(
+        {"pw-play", "--volume", "0.5", "--media-role", role, audio->makeTone(seconds)});
+  }
+
+  std::unique_ptr<PrivatePipeWire> audio;
+  std::unique_ptr<MainLoop> loop;
+  RecordingReportingClient client;
+  StreamTracker tracker{client};
+  std::unique_ptr<PipeWireSource> source;
+  std::vector<std::string> log;
+};
+
+TEST_F(PipeWireSourceTest, ReportsPlaybackFromItsStartToItsEnd) {
+  ChildProcess player = play(0.5);
+
+  ASSERT_TRUE(waitFor("destroy"));
+
+  EXPECT_EQ(player.wait(), 0);
+  EXPECT_THAT(client.operations(),
+              testing::IsSupersetOf({"create", "type", "configure", "start", "format", "route",
+                                     "playback-start", "volume", "playback-stop", "stop"}));
+  EXPECT_EQ(client.calls()[1].serviceType, kServiceLongFormAudio);
+  EXPECT_EQ(client.calls()[2].dictionary.find(kApplicationKey)->string(), "pw-play");
+  EXPECT_TRUE(client.calls()[2].dictionary.contains("process_id"));
+  EXPECT_THAT(std::string(client.last("format").find(kFormatKey)->string()),
+              testing::MatchesRegex("[A-Z0-9]+ 48000 Hz 1 ch"));
+  EXPECT_EQ(client.last("route").find(kDevicesKey)->string(), "Demo speakers");
+  EXPECT_EQ(
+      client.last("volume"),
+      (platform::Dictionary{{kVolumeKey, 0.5}, {kPlayingKey, 0}, {kVolumeProcessKey, "pw-cat"}}));
+}
+
+TEST_F(PipeWireSourceTest, ReportsAVolumeThatIsChangedWhilePlaying) {
+  const ChildProcess player = play(20);
+  ASSERT_TRUE(waitFor("volume"));
+
+  ChildProcess control({"pw-cli", "s", "pw-play", "Props", "{ channelVolumes: [ 0.5 ] }"});
+  ASSERT_TRUE(waitFor("volume", 2));
+  EXPECT_EQ(control.wait(), 0);
+
+  EXPECT_EQ(client.last("volume").find(kVolumeKey)->toDouble(), 0.25);
+  EXPECT_TRUE(client.last("volume").find(kPlayingKey)->toBool());
+}
+
+TEST_F(PipeWireSourceTest, ReportsCapture) {
+  const ChildProcess recorder(
+      {"pw-record", "-P", "{ stream.capture.sink=true }", audio->directory() / "out.wav"});
+
+  ASSERT_TRUE(waitFor("route"));
+
+  EXPECT_EQ(client.last("route").find(kDevicesKey)->string(), "Demo speakers");
+  EXPECT_TRUE(waitFor("record-start"));
+}
+
+TEST_F(PipeWireSourceTest, ReportsTheSerialOfTheStreamInItsIdentifier) {
+  const ChildProcess player = play(20);
+  ASSERT_TRUE(waitFor("configure"));
+
+  const auto serial = client.last("configure").find("object_serial")->toUInt64();
+
+  EXPECT_GT(serial, 0U);
+  EXPECT_EQ(static_cast<std::uint64_t>(client.calls().front().id) & 0xFFFFFFFFU, serial);
+}
+
+TEST_F(PipeWireSourceTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItReturns) {
+  {
+    const ChildProcess player = play(20);
+    ASSERT_TRUE(waitFor("playback-start"));
+    ASSERT_TRUE(audio->restart());
+    ASSERT_TRUE(waitFor("destroy"));
+    EXPECT_EQ(client.calls().back().operation, "destroy");
+  }
+  ASSERT_TRUE(waitUntil([&] {
+    return std::ranges::count_if(
+               log, [](const auto& line) { return line.starts_with("following"); }) == 2;
+  }));
+
+  const ChildProcess player = play(20, "phone");
+
+  EXPECT_TRUE(waitFor("playback-start", 2));
+}
+
+TEST_F(PipeWireSourceTest, SleepsWhileNothingChanges) {
+  const ChildProcess player = play(20);
+  ASSERT_TRUE(waitFor("volume"));
+  // What still comes of the start comes within moments.
+  while (pw_loop_iterate(loop->handle(), 500) > 0) {
+  }
+
+  constexpr int kSeconds = 2;
+  const int woken = pw_loop_iterate(loop->handle(), kSeconds * 1000);
+
+  EXPECT_EQ(woken, 0);
+}
+
+TEST_F(PipeWireSourceTest, WaitsForAPipeWireThatIsNotThere) {
+  source.reset();
+  log.clear();
+
+  source = std::make_unique<PipeWireSource>(
+      loop->handle(), tracker,
+      PipeWireSource::Options{.remote = "nobody-home",
+                              .log = [this](std::string_view line) { log.emplace_back(line); }});
+  for (int i = 0; i < 3; ++i) {
+    pw_loop_iterate(loop->handle(), 500);
+  }
+
+  EXPECT_THAT(log, testing::ElementsAre(testing::StartsWith("waiting for PipeWire")));
+}
+
+}  // namespace
+}  // namespace halvox::pipewire_reporter

@@ -1,0 +1,187 @@
+#include "reporters/pipewire/StreamSession.h"
+
+#include <vector>
+
+#include "reporters/pipewire/ReportingVocabulary.h"
+
+namespace halvox::pipewire_reporter {
+namespace {
+
+constexpr std::string_view kRoleProperty = "media.role";
+
+// The entries of `now` that `before` lacks or has otherwise.
+platform::Dictionary changedEntries(const platform::Dictionary& before,
+                                    const platform::Dictionary& now) {
+  platform::Dictionary changed;
+  for (const auto& [key, value] : now) {
+    const platform::Value* old = before.find(key);
+    if (old == nullptr || !(*old == value)) {
+      changed.set(key, value);
+    }
+  }
+  return changed;
+}
+
+std::string describeRoute(const Route& route) {
+  std::string text;
+  for (const auto& device : route.devices) {
+    text += (text.empty() ? "" : ", ") + device.description;
+  }
+  return text;
+}
+
+platform::Array deviceNames(const Route& route) {
+  std::vector<platform::Value> names;
+  for (const auto& device : route.devices) {
+    names.emplace_back(device.name);
+  }
+  return platform::Array(names);
+}
+
+}  // namespace
+
+StreamSession::StreamSession(ReportingClient& client, ReporterID id, Direction direction,
+                             const Properties& properties)
+    : client_(client),
+      id_(id),
+      direction_(direction),
+      serviceType_(serviceTypeForRole(property(properties, kRoleProperty))),
+      configuration_(makeConfiguration(properties)),
+      process_(processName(properties)) {
+  client_.createSession(id_);
+  client_.setServiceType(id_, serviceType_);
+  client_.setConfiguration(id_, configuration_);
+}
+
+StreamSession::~StreamSession() {
+  setRunning(false);
+  if (started_) {
+    client_.stop(id_);
+  }
+  client_.destroySession(id_);
+}
+
+void StreamSession::setProperties(const Properties& properties) {
+  process_ = processName(properties);
+  const ServiceType type = serviceTypeForRole(property(properties, kRoleProperty));
+  if (type != serviceType_) {
+    serviceType_ = type;
+    client_.setServiceType(id_, type);
+  }
+  const platform::Dictionary changed =
+      changedEntries(configuration_, makeConfiguration(properties));
+  if (!changed.empty()) {
+    configuration_.merge(changed);
+    client_.setConfiguration(id_, changed);
+  }
+}
+
+void StreamSession::setRunning(bool running) {
+  if (running == running_) {
+    return;
+  }
+  running_ = running;
+  if (running) {
+    beginRun();
+  } else {
+    endRun();
+  }
+}
+
+void StreamSession::setFormat(const StreamFormat& format) {
+  std::string text = describeFormat(format);
+  if (text.empty() || text == format_) {
+    return;
+  }
+  format_ = std::move(text);
+  if (started_) {
+    sendFormat();
+  }
+}
+
+void StreamSession::setRoute(const Route& route) {
+  if (route.devices.empty() || route == route_) {
+    return;
+  }
+  route_ = route;
+  if (started_) {
+    sendRoute();
+  }
+}
+
+void StreamSession::changeVolume(const VolumeChange& change) {
+  volume_.apply(change);
+  if (started_) {
+    sendVolumeIfChanged();
+  }
+}
+
+void StreamSession::restate() {
+  if (!started_) {
+    return;
+  }
+  sentVolume_.reset();
+  sendFormat();
+  sendRoute();
+  sendVolumeIfChanged();
+}
+
+void StreamSession::beginRun() {
+  ++run_;
+  if (!started_) {
+    started_ = true;
+    client_.start(id_);
+    sendFormat();
+    sendRoute();
+  }
+  sendRun(kTypeStart);
+  sendVolumeIfChanged();
+}
+
+void StreamSession::endRun() {
+  // The volume first, so that its played time ends within the run.
+  sendVolumeIfChanged();
+  sendRun(kTypeStop);
+}
+
+void StreamSession::sendFormat() {
+  if (!format_.empty()) {
+    client_.send(id_, {{kFormatKey, format_}}, kCategorySessionSetup, kTypeSetup);
+  }
+}
+
+void StreamSession::sendRoute() {
+  if (!route_.devices.empty()) {
+    client_.send(id_,
+                 {{kDevicesKey, describeRoute(route_)}, {kDeviceNamesKey, deviceNames(route_)}},
+                 kCategoryRouteChange, kTypeState);
+  }
+}
+
+void StreamSession::sendVolumeIfChanged() {
+  const auto volume = volume_.effective();
+  if (!volume) {
+    return;
+  }
+  const VolumeState state{.volume = *volume, .playing = running_};
+  if (sentVolume_ == state) {
+    return;
+  }
+  sentVolume_ = state;
+  // PipeWire does not tell who turned a stream's volume, so it is put down to the stream's process.
+  client_.send(id_,
+               {{kVolumeKey, state.volume},
+                {kPlayingKey, state.playing ? 1 : 0},
+                {kVolumeProcessKey, process_}},
+               kCategoryVolume, kTypeState);
+}
+
+void StreamSession::sendRun(EventType type) {
+  client_.send(id_, {{kRunKey, run_}}, category(), type);
+}
+
+Category StreamSession::category() const {
+  return direction_ == Direction::kPlayback ? kCategorySessionPlayback : kCategorySessionRecord;
+}
+
+}  // namespace halvox::pipewire_reporter

@@ -1,0 +1,71 @@
+#pragma once
+
+#include <optional>
+#include <string>
+
+#include "reporters/pipewire/ReportingClient.h"
+#include "reporters/pipewire/RouteGraph.h"
+#include "reporters/pipewire/StreamProperties.h"
+#include "reporters/pipewire/StreamValues.h"
+
+namespace halvox::pipewire_reporter {
+
+// The reporting session of one stream.
+//
+//   made: session created, typed and configured
+//     └─ first run: session started ─┬─ runs: Start, volume (playing)
+//                                    └─ idles: volume (not playing), Stop
+//   destroyed: as for idling if it runs; session stopped if it was started, then destroyed
+//
+// What is told before the first run is kept and sent with the start. What is told again without a
+// change is sent once. Belongs to the loop thread; borrows the client, which must outlive it.
+class StreamSession {
+ public:
+  StreamSession(ReportingClient& client, ReporterID id, Direction direction,
+                const Properties& properties);
+  ~StreamSession();
+  StreamSession(const StreamSession&) = delete;
+  StreamSession& operator=(const StreamSession&) = delete;
+
+  void setProperties(const Properties& properties);
+  void setRunning(bool running);
+  void setFormat(const StreamFormat& format);
+  // An empty route is no news: a stream that is being moved has none for a moment.
+  void setRoute(const Route& route);
+  void changeVolume(const VolumeChange& change);
+  // Says again what holds now; for a service that has lost what it was told.
+  void restate();
+
+  [[nodiscard]] Direction direction() const { return direction_; }
+
+ private:
+  void beginRun();
+  void endRun();
+  void sendFormat();
+  void sendRoute();
+  void sendVolumeIfChanged();
+  void sendRun(EventType type);
+  [[nodiscard]] Category category() const;
+
+  struct VolumeState {
+    double volume = 0;
+    bool playing = false;
+    friend bool operator==(const VolumeState&, const VolumeState&) = default;
+  };
+
+  ReportingClient& client_;
+  const ReporterID id_;
+  const Direction direction_;
+  ServiceType serviceType_;
+  platform::Dictionary configuration_;
+  std::string process_;
+  std::string format_;
+  Route route_;
+  StreamVolume volume_;
+  std::optional<VolumeState> sentVolume_;
+  bool started_ = false;
+  bool running_ = false;
+  std::int64_t run_ = 0;
+};
+
+}  // namespace halvox::pipewire_reporter

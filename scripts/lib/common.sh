@@ -1,0 +1,167 @@
+# shellcheck shell=bash
+# Helpers for our scripts: what they say, the processes that they start, and leaving nothing behind.
+# To be sourced by a bash script that runs with `set -euo pipefail`.
+#
+# A script that starts processes does, before the first:
+#   halvox_make_scratch NAME          # a directory of its own, in $HALVOX_SCRATCH
+#   halvox_clean_up_on_exit           # whatever happens: processes stopped, directory removed
+# On a failure the ends of the logs in the scratch directory (*.log) are shown first.
+
+HALVOX_SCRIPT=${HALVOX_SCRIPT:-$(basename "$0")}
+HALVOX_SCRATCH=${HALVOX_SCRATCH:-}
+# The processes that are ours, oldest first, as "pid name". Each leads a process group of its own.
+HALVOX_PROCESSES=()
+HALVOX_STOP_SECONDS=5
+
+# One line for the person at the terminal.
+say() { printf '%s\n' "$HALVOX_SCRIPT: $*"; }
+
+# The headline of the next step.
+step() { printf '\n==> %s\n' "$*"; }
+
+# Ends the script with a message.
+fail() {
+  printf '%s\n' "$HALVOX_SCRIPT: $*" >&2
+  exit 1
+}
+
+# Waits until a command succeeds: halvox_wait_for WHAT SECONDS COMMAND...
+# Returns 1, and says what was awaited, when the time is up. Other processes ending early is the
+# command's to notice.
+halvox_wait_for() {
+  local what=$1 seconds=$2 end
+  shift 2
+  end=$((SECONDS + seconds))
+  until "$@" >/dev/null 2>&1; do
+    if ((SECONDS > end)); then
+      printf '%s\n' "$HALVOX_SCRIPT: waited $seconds s in vain for $what" >&2
+      return 1
+    fi
+    sleep 0.05
+  done
+}
+
+# Starts a process in the background: halvox_start NAME LOG COMMAND...
+# Sets HALVOX_PID. It gets its own process group, so that a Ctrl-C at the terminal reaches the
+# script alone, which then stops everything in order; and it ends should the script be killed.
+# Not to be called in a subshell: the process would belong to that.
+halvox_start() {
+  local name=$1 log=$2
+  shift 2
+  setsid setpriv --pdeathsig TERM -- "$@" >>"$log" 2>&1 </dev/null &
+  HALVOX_PID=$!
+  HALVOX_PROCESSES+=("$HALVOX_PID $name")
+}
+
+halvox_is_running() { kill -0 "$1" 2>/dev/null; }
+
+# Whether anything is left of the process group that a process led.
+halvox_group_lives() { kill -0 -- "-$1" 2>/dev/null; }
+
+halvox_forget() {
+  local entry kept=()
+  for entry in ${HALVOX_PROCESSES[@]+"${HALVOX_PROCESSES[@]}"}; do
+    [ "${entry%% *}" = "$1" ] || kept+=("$entry")
+  done
+  HALVOX_PROCESSES=(${kept[@]+"${kept[@]}"})
+}
+
+# Waits for a process that ends by itself; returns its exit status.
+halvox_wait() {
+  local status=0
+  wait "$1" || status=$?
+  halvox_forget "$1"
+  return "$status"
+}
+
+# Stops a process and whatever it started: first politely, after some seconds for good.
+halvox_stop() {
+  local pid=$1 end=$((SECONDS + HALVOX_STOP_SECONDS))
+  # The group does not exist before the process has come to make it.
+  kill -TERM -- "-$pid" 2>/dev/null || kill -TERM "$pid" 2>/dev/null || true
+  while halvox_is_running "$pid" || halvox_group_lives "$pid"; do
+    if ((SECONDS > end)); then
+      kill -KILL -- "-$pid" 2>/dev/null || true
+      break
+    fi
+    sleep 0.02
+  done
+  wait "$pid" 2>/dev/null || true
+  halvox_forget "$pid"
+}
+
+# Stops all that is still running, youngest first.
+halvox_stop_all() {
+  local entry
+  while ((${#HALVOX_PROCESSES[@]} > 0)); do
+    entry=${HALVOX_PROCESSES[-1]}
+    halvox_stop "${entry%% *}"
+  done
+}
+
+halvox_make_scratch() {
+  HALVOX_SCRATCH=$(mktemp -d "${TMPDIR:-/tmp}/halvox-$1.XXXXXX")
+}
+
+# The ends of the logs, for a person who has to find out what went wrong.
+halvox_show_logs() {
+  local log
+  for log in "$HALVOX_SCRATCH"/*.log; do
+    [ -s "$log" ] || continue
+    printf '\n--- the end of %s\n' "$(basename "$log")" >&2
+    tail -n 15 "$log" >&2
+  done
+}
+
+halvox_clean_up() {
+  local status=$?
+  trap '' INT TERM HUP
+  # 130 and above: somebody asked for the end, that is no failure.
+  if ((status != 0 && status < 129)) && [ -n "$HALVOX_SCRATCH" ]; then
+    halvox_show_logs
+  fi
+  halvox_stop_all
+  [ -z "$HALVOX_SCRATCH" ] || rm -rf "$HALVOX_SCRATCH"
+  exit "$status"
+}
+
+halvox_clean_up_on_exit() {
+  trap halvox_clean_up EXIT
+  trap 'exit 130' INT
+  trap 'exit 143' TERM
+  trap 'exit 129' HUP
+}
+
+# How far a log says that its command has come: the last "[3/120]", as Ninja writes it.
+halvox_progress_in() {
+  tail -c 4000 "$1" 2>/dev/null | grep -oE '\[[0-9]+/[0-9]+\]' | tail -n 1 || true
+}
+
+# Runs a command that takes its time: halvox_run WHAT LOG COMMAND...
+# Shows that it goes on: a spinner with the seconds at a terminal, a line every ten seconds
+# elsewhere. When it fails, shows the end of its output and returns its status.
+halvox_run() {
+  local what=$1 log=$2 pid status=0 begin=$SECONDS told=0 ticks=0 spinner='|/-\'
+  shift 2
+  : >"$log"
+  halvox_start "$what" "$log" "$@"
+  pid=$HALVOX_PID
+  while halvox_is_running "$pid"; do
+    if [ -t 1 ]; then
+      printf '\r%s %s %s %d s\033[K' "${spinner:ticks++%4:1}" "$what" \
+        "$(halvox_progress_in "$log")" $((SECONDS - begin))
+    elif ((SECONDS - begin >= told + 10)); then
+      told=$((SECONDS - begin))
+      say "$what $(halvox_progress_in "$log") $told s"
+    fi
+    sleep 0.1
+  done
+  [ ! -t 1 ] || printf '\r\033[K'
+  halvox_wait "$pid" || status=$?
+  if ((status != 0)); then
+    say "$what: failed (exit status $status); the end of its output:" >&2
+    tail -n 30 "$log" >&2
+    return "$status"
+  fi
+  say "$what: done in $((SECONDS - begin)) s"
+}

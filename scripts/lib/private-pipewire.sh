@@ -1,0 +1,164 @@
+#!/usr/bin/env bash
+# A PipeWire of our own: no hardware, no systemd, nothing shared with the desktop's.
+# One null sink ("Demo speakers", node demo-speakers) drives the graph with a real clock, so
+# streams really run; its monitor is the only source. WirePlumber links streams to it.
+#
+# As a program:  private-pipewire.sh check
+#   Says which tools are missing; exit status 1 then.
+#                private-pipewire.sh serve DIRECTORY
+#   Prints "ready" once streams can run, then "restarted" for each line "restart" that it reads, and
+#   stops everything when its standard input ends. The environment that clients need is in
+#   DIRECTORY/environment, one NAME=value a line.
+# To be sourced, after common.sh:
+#   halvox_audio_start DIRECTORY      # starts and waits; exports what clients need
+#   halvox_audio_stop
+#
+# DIRECTORY must be short (a socket's path has at most 107 bytes) and exist.
+
+HALVOX_AUDIO_TOOLS=(dbus-daemon pipewire wireplumber pw-cli pw-dump pw-play pw-record)
+
+# Says which tools are missing, if any; returns 1 then.
+halvox_audio_check() {
+  local tool missing=()
+  for tool in "${HALVOX_AUDIO_TOOLS[@]}"; do
+    command -v "$tool" >/dev/null || missing+=("$tool")
+  done
+  if ((${#missing[@]} > 0)); then
+    printf 'missing: %s\n' "${missing[*]}"
+    return 1
+  fi
+}
+
+halvox_audio_write_configuration() {
+  local directory=$1
+  mkdir -p "$directory/config/wireplumber/main.lua.d" \
+    "$directory/config/wireplumber/bluetooth.lua.d" "$directory/state"
+  mkdir -p -m 700 "$directory/run"
+  # On a machine with sound cards: hands off them.
+  printf '%s.enabled = false\n' alsa_monitor v4l2_monitor libcamera_monitor \
+    >"$directory/config/wireplumber/main.lua.d/60-no-hardware.lua"
+  printf 'bluez_monitor.enabled = false\n' \
+    >"$directory/config/wireplumber/bluetooth.lua.d/60-no-hardware.lua"
+  cat >"$directory/pipewire.conf" <<'END'
+context.properties = {
+    core.daemon = true
+    core.name = pipewire-0
+    link.max-buffers = 16
+    mem.warn-mlock = false
+    support.dbus = false
+}
+context.spa-libs = {
+    audio.convert.* = audioconvert/libspa-audioconvert
+    support.* = support/libspa-support
+}
+context.modules = [
+    { name = libpipewire-module-protocol-native }
+    { name = libpipewire-module-profiler }
+    { name = libpipewire-module-metadata }
+    { name = libpipewire-module-spa-device-factory }
+    { name = libpipewire-module-spa-node-factory }
+    { name = libpipewire-module-client-node }
+    { name = libpipewire-module-client-device }
+    { name = libpipewire-module-access args = { } }
+    { name = libpipewire-module-adapter }
+    { name = libpipewire-module-link-factory }
+    { name = libpipewire-module-session-manager }
+]
+context.objects = [
+    { factory = adapter
+      args = {
+        factory.name = support.null-audio-sink
+        node.name = demo-speakers
+        node.description = "Demo speakers"
+        media.class = Audio/Sink
+        object.linger = true
+        audio.position = [ FL FR ]
+        priority.driver = 10000
+        priority.session = 1000
+        monitor.channel-volumes = true
+        adapter.auto-port-config = { mode = dsp monitor = true position = preserve }
+      }
+    }
+]
+END
+}
+
+# Puts the caller's environment, and with it all its children, into the private world.
+halvox_audio_enter() {
+  local directory=$1
+  unset PIPEWIRE_REMOTE PIPEWIRE_RUNTIME_DIR PIPEWIRE_CONFIG_DIR PIPEWIRE_CONFIG_NAME
+  unset WIREPLUMBER_CONFIG_DIR WIREPLUMBER_DATA_DIR DISPLAY WAYLAND_DISPLAY
+  export XDG_RUNTIME_DIR=$directory/run
+  export XDG_CONFIG_HOME=$directory/config
+  export XDG_STATE_HOME=$directory/state
+  export DBUS_SESSION_BUS_ADDRESS=unix:path=$directory/run/bus
+}
+
+halvox_audio_socket_exists() { [ -S "$1" ]; }
+
+# WirePlumber has found the sink and chosen it: from here on it links streams to it.
+halvox_audio_has_default_sink() { pw-dump | grep -q '"default.audio.sink"'; }
+
+halvox_audio_start_servers() {
+  local directory=$1
+  halvox_start pipewire "$directory/pipewire.log" pipewire -c "$directory/pipewire.conf"
+  HALVOX_PIPEWIRE_PID=$HALVOX_PID
+  halvox_wait_for "PipeWire's socket" 10 halvox_audio_socket_exists "$XDG_RUNTIME_DIR/pipewire-0"
+  halvox_start wireplumber "$directory/wireplumber.log" wireplumber
+  HALVOX_WIREPLUMBER_PID=$HALVOX_PID
+  halvox_wait_for "WirePlumber to find the sink" 20 halvox_audio_has_default_sink
+}
+
+halvox_audio_stop_servers() {
+  halvox_stop "$HALVOX_WIREPLUMBER_PID"
+  halvox_stop "$HALVOX_PIPEWIRE_PID"
+  rm -f "$XDG_RUNTIME_DIR"/pipewire-0*
+}
+
+halvox_audio_start() {
+  local directory=$1
+  halvox_audio_check || return 1
+  halvox_audio_write_configuration "$directory"
+  halvox_audio_enter "$directory"
+  halvox_start dbus-daemon "$directory/dbus.log" dbus-daemon --session --nofork --nopidfile \
+    "--address=$DBUS_SESSION_BUS_ADDRESS"
+  HALVOX_BUS_PID=$HALVOX_PID
+  halvox_wait_for "the private bus" 10 halvox_audio_socket_exists "$XDG_RUNTIME_DIR/bus"
+  halvox_audio_start_servers "$directory"
+}
+
+halvox_audio_stop() {
+  halvox_audio_stop_servers
+  halvox_stop "$HALVOX_BUS_PID"
+}
+
+halvox_audio_serve() {
+  local directory=$1 line
+  halvox_clean_up_on_exit
+  halvox_audio_start "$directory"
+  printf '%s=%s\n' XDG_RUNTIME_DIR "$XDG_RUNTIME_DIR" XDG_CONFIG_HOME "$XDG_CONFIG_HOME" \
+    XDG_STATE_HOME "$XDG_STATE_HOME" DBUS_SESSION_BUS_ADDRESS "$DBUS_SESSION_BUS_ADDRESS" \
+    >"$directory/environment"
+  echo ready
+  while read -r line; do
+    if [ "$line" = restart ]; then
+      halvox_audio_stop_servers
+      halvox_audio_start_servers "$directory"
+      echo restarted
+    fi
+  done
+}
+
+if [ "${BASH_SOURCE[0]}" = "$0" ]; then
+  set -euo pipefail
+  # shellcheck source=scripts/lib/common.sh
+  . "$(dirname "${BASH_SOURCE[0]}")/common.sh"
+  if [ "${1:-}" = check ]; then
+    halvox_audio_check
+  elif [ "${1:-}" = serve ] && [ $# -eq 2 ] && [ -d "$2" ]; then
+    halvox_audio_serve "$(realpath "$2")"
+  else
+    echo "usage: private-pipewire.sh check | serve DIRECTORY" >&2
+    exit 2
+  fi
+fi
