@@ -31,6 +31,20 @@ std::uint64_t codeOf(AudioEventCategory category, AudioEventType type) {
          static_cast<std::uint16_t>(type);
 }
 
+std::size_t countLastingEntries(const Dictionary& message) {
+  return message.size() -
+         static_cast<std::size_t>(std::count_if(message.begin(), message.end(), isVolatile));
+}
+
+bool equalInAnyOrder(const Dictionary& left, const Dictionary& right) {
+  if (countLastingEntries(left) != countLastingEntries(right)) return false;
+  return std::all_of(left.begin(), left.end(), [&right](const Dictionary::Entry& entry) {
+    if (isVolatile(entry)) return true;
+    const platform::Value* counterpart = right.find(entry.key);
+    return counterpart != nullptr && *counterpart == entry.value;
+  });
+}
+
 }  // namespace
 
 std::string MessageHistory::Entry::identifier() const {
@@ -77,21 +91,18 @@ void MessageHistory::append(Base& base, Dictionary message) {
 
 bool equalApartFromVolatileKeys(const Dictionary& left, const Dictionary& right) {
   if (left.isIdenticalTo(right)) return true;
-  const auto volatileEntries = [](const Dictionary& message) {
-    return static_cast<std::size_t>(std::count_if(message.begin(), message.end(), isVolatile));
-  };
-  if (left.size() - volatileEntries(left) != right.size() - volatileEntries(right)) return false;
-  // Repeated messages have their keys in the same order, so the same place is tried first.
-  const Dictionary::Entry* other = right.begin();
-  for (const Dictionary::Entry& entry : left) {
-    const bool samePlace = other != right.end() && other->key == entry.key;
-    const platform::Value* counterpart = samePlace ? &other->value : nullptr;
-    if (other != right.end()) ++other;
-    if (isVolatile(entry)) continue;
-    if (counterpart == nullptr) counterpart = right.find(entry.key);
-    if (counterpart == nullptr || !(*counterpart == entry.value)) return false;
+  // Repeated messages nearly always have the same keys in the same order.
+  if (left.size() == right.size()) {
+    const Dictionary::Entry* other = right.begin();
+    const Dictionary::Entry* entry = left.begin();
+    while (entry != left.end() && entry->key == other->key) {
+      if (!(entry->value == other->value) && !isVolatile(*entry)) return false;
+      ++entry;
+      ++other;
+    }
+    if (entry == left.end()) return true;
   }
-  return true;
+  return equalInAnyOrder(left, right);
 }
 
 }  // namespace halvox

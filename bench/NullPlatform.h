@@ -1,0 +1,187 @@
+#pragma once
+
+#include <deque>
+#include <map>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "platform/analytics.h"
+#include "platform/clock.h"
+#include "platform/connection.h"
+#include "platform/device_properties.h"
+#include "platform/dispatch.h"
+#include "platform/feature_flags.h"
+#include "platform/kdebug.h"
+#include "platform/log.h"
+#include "platform/process.h"
+#include "platform/services.h"
+#include "platform/statistics.h"
+
+namespace halvox::bench {
+
+// Services that cost as little as a service can, so that a benchmark measures the inner ring alone:
+// nobody wants an event, a trace or a line of the log, and queued jobs wait in one list until the
+// benchmark runs them.
+
+class NullAnalytics final : public platform::AnalyticsService {
+ public:
+  bool isAnalyticsEventUsed(std::string_view /*eventName*/) override { return false; }
+  void sendAnalyticsEventLazy(std::string /*name*/,
+                              platform::AnalyticsPayloadBuilder /*builder*/) override {}
+};
+
+// Goes on by a millisecond at every look.
+class SteppingClock final : public platform::ClockService {
+ public:
+  platform::Date currentDate() const override { return {1.7e9 + 0.001 * ++looks_}; }
+  std::chrono::duration<double> systemUptime() const override {
+    return std::chrono::duration<double>(0.001 * looks_);
+  }
+  std::chrono::milliseconds processUptime() const override {
+    return std::chrono::milliseconds(static_cast<std::int64_t>(looks_));
+  }
+
+ private:
+  mutable double looks_ = 0;
+};
+
+class NullConnections final : public platform::ConnectionService {
+ public:
+  [[noreturn]] platform::NSXPCListener& serviceListener() override { std::abort(); }
+  const platform::NSXPCConnection* currentConnection() const override { return nullptr; }
+  platform::RequestToken currentRequest() const override { return token_; }
+
+ private:
+  platform::RequestToken token_ = std::make_shared<int>();
+};
+
+class NullDeviceProperties final : public platform::DevicePropertyService {
+ public:
+  std::optional<platform::Value> copyDeviceProperty(std::string_view /*key*/) const override {
+    return std::nullopt;
+  }
+};
+
+class ListQueue final : public platform::DispatchQueue {
+ public:
+  explicit ListQueue(std::deque<platform::Job>& jobs) : jobs_(jobs) {}
+  void async(platform::JobWeight /*weight*/, platform::Job job) override {
+    jobs_.push_back(std::move(job));
+  }
+  bool isCurrent() const override { return true; }
+
+ private:
+  std::deque<platform::Job>& jobs_;  // owned by the ListDispatch
+};
+
+class ListDispatch final : public platform::DispatchService {
+ public:
+  std::shared_ptr<platform::DispatchQueue> createSerialQueue(
+      std::string_view /*label*/, platform::QualityOfService /*quality*/,
+      platform::QueueThreading /*threading*/) override {
+    return std::make_shared<ListQueue>(jobs_);
+  }
+  void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds /*delay*/,
+                                   platform::Job /*job*/) override {}
+  void runAll() {
+    while (!jobs_.empty()) {
+      const platform::Job job = std::move(jobs_.front());
+      jobs_.pop_front();
+      job();
+    }
+  }
+
+ private:
+  std::deque<platform::Job> jobs_;
+};
+
+class NullFeatureFlags final : public platform::FeatureFlagService {
+ public:
+  bool _os_feature_enabled_impl(std::string_view /*domain*/,
+                                std::string_view /*feature*/) const override {
+    return false;
+  }
+};
+
+class NullKdebug final : public platform::KdebugService {
+ public:
+  void kdebug_trace(std::uint32_t /*code*/, std::uint64_t /*first*/, std::uint64_t /*second*/,
+                    std::uint64_t /*third*/, std::uint64_t /*fourth*/) override {}
+};
+
+class NullLogCategory final : public platform::LogCategory {
+ public:
+  explicit NullLogCategory(platform::LogLevel level) : LogCategory(level) {}
+  void write(platform::LogLevel /*level*/, std::string_view line) override {
+    bytes_ += line.size();
+  }
+  [[nodiscard]] std::size_t bytes() const { return bytes_; }
+
+ private:
+  std::size_t bytes_ = 0;
+};
+
+class NullLog final : public platform::LogService {
+ public:
+  explicit NullLog(platform::LogLevel level) : category_(level) {}
+  platform::LogCategory& createCategory(std::string_view /*subsystem*/,
+                                        std::string_view /*category*/) override {
+    return category_;
+  }
+  [[nodiscard]] std::size_t bytes() const { return category_.bytes(); }
+
+ private:
+  NullLogCategory category_;
+};
+
+class NullProcess final : public platform::ProcessService {
+ public:
+  std::optional<platform::ProcessRecord> processRecord(platform::ProcessID pid) const override {
+    return platform::ProcessRecord{.pid = pid, .commandName = "bench"};
+  }
+  platform::ProcessID ownProcessIdentifier() const override { return 1; }
+  std::string ownProcessName() const override { return "bench"; }
+  [[noreturn]] void terminate(int /*exitStatus*/) override { std::abort(); }
+};
+
+class MapStatistics final : public platform::StatisticsService {
+ public:
+  platform::Counter& counter(std::string_view piece, std::string_view name) override {
+    return counters_[{std::string(piece), std::string(name)}];
+  }
+
+ private:
+  std::map<std::pair<std::string, std::string>, platform::Counter> counters_;
+};
+
+// All of them, installed for good: code under test remembers categories and counters.
+struct NullPlatform {
+  explicit NullPlatform(platform::LogLevel level) : log(level) {
+    platform::installServices({.analytics = analytics,
+                               .clock = clock,
+                               .connections = connections,
+                               .deviceProperties = deviceProperties,
+                               .dispatch = dispatch,
+                               .featureFlags = featureFlags,
+                               .kdebug = kdebug,
+                               .log = log,
+                               .process = process,
+                               .statistics = statistics});
+  }
+
+  NullAnalytics analytics;
+  SteppingClock clock;
+  NullConnections connections;
+  NullDeviceProperties deviceProperties;
+  ListDispatch dispatch;
+  NullFeatureFlags featureFlags;
+  NullKdebug kdebug;
+  NullLog log;
+  NullProcess process;
+  MapStatistics statistics;
+};
+
+}  // namespace halvox::bench

@@ -1,0 +1,175 @@
+#include <memory>
+#include <string>
+#include <vector>
+
+#include <benchmark/benchmark.h>
+
+#include "bench/NullPlatform.h"
+#include "service/HVReportingClientServerInstance.h"
+#include "service/HVReportingServiceDelegate.h"
+#include "session/HVReportingSession.h"
+
+// What one message costs between the connection and the back-ends: queued by the client object,
+// carried out on the reporting queue, stamped, offered to the analytics service (which wants
+// nothing), compared and recorded. The connection and the queue themselves are not in it.
+
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+
+constexpr std::int64_t kBatch = 10'000;
+
+bench::NullPlatform& nullPlatform() {
+  // Errors only, as nobody reads the log of a benchmark.
+  static auto* instance = new bench::NullPlatform(platform::LogLevel::kError);
+  return *instance;
+}
+
+// Ten fields, as audio frameworks send them; the number makes it differ from all others.
+Dictionary makeMessage(std::int64_t number) {
+  Dictionary message;
+  message.reserve(10);
+  message.set("frame_counter", number);
+  message.set("sample_rate", 48000.0);
+  message.set("channels", std::int32_t{2});
+  message.set("io_buffer_frames", std::int32_t{512});
+  message.set("is_running", true);
+  message.set("volume", 0.75);
+  message.set("route", "Speaker");
+  message.set("format", "lpcm/float32");
+  message.set("device_uid", "alsa_output.pci-0000_00_1f.3.analog-stereo");
+  message.set("latency_ms", 10.67);
+  return message;
+}
+
+std::vector<Dictionary> makeMessages(std::int64_t first) {
+  std::vector<Dictionary> messages;
+  messages.reserve(kBatch);
+  for (std::int64_t index = 0; index < kBatch; ++index) {
+    messages.push_back(makeMessage(first + index));
+  }
+  return messages;
+}
+
+// A service whose last client sends to a session of its own, with others beside it.
+class Scene {
+ public:
+  Scene(std::int64_t clients, std::int64_t sessions)
+      : dispatch_(nullPlatform().dispatch),
+        delegate_(std::make_shared<HVReportingServiceDelegate>()) {
+    for (std::int64_t index = 0; index < clients; ++index) connect();
+    for (std::int64_t index = 1; index < sessions; ++index) startSession(ReporterID{index});
+    target_ = ReporterID{sessions};
+    startSession(target_);
+    dispatch_.runAll();
+  }
+
+  void restart() {
+    sender().stopReportingSessionForID(target_, ignore);
+    sender().startReportingSessionForID(target_, ignore);
+    dispatch_.runAll();
+  }
+  void send(Dictionary message) {
+    sender().sendMessage(std::move(message), AudioEventCategory::kPlayback, AudioEventType::kState,
+                         std::vector{target_}, [](const auto& /*error*/) {});
+  }
+  void runAll() { dispatch_.runAll(); }
+
+ private:
+  static void ignore(const std::optional<platform::Error>& /*error*/, bool /*value*/) {}
+
+  HVReportingClientServerInstance& sender() { return *connections_.back()->object; }
+
+  // Holds what a real connection would hold.
+  struct Connection final : platform::NSXPCConnection {
+    platform::ProcessID processIdentifier() const override { return 100; }
+    std::string description() const override { return "bench"; }
+    void setExportedInterface(const platform::NSXPCInterface& /*interface*/) override {}
+    void setExportedObject(std::shared_ptr<platform::ExportedObject> exported) override {
+      object = std::static_pointer_cast<HVReportingClientServerInstance>(exported);
+    }
+    void setInterruptionHandler(std::function<void()> /*handler*/) override {}
+    void setInvalidationHandler(std::function<void()> /*handler*/) override {}
+    void resume() override {}
+    std::shared_ptr<HVReportingClientServerInstance> object;
+  };
+
+  void connect() {
+    connections_.push_back(std::make_shared<Connection>());
+    delegate_->listenerShouldAcceptNewConnection(connections_.back());
+  }
+  void startSession(ReporterID reporterID) {
+    sender().createReportingSession(reporterID, ignore);
+    sender().startReportingSessionForID(reporterID, ignore);
+    dispatch_.runAll();
+  }
+
+  bench::ListDispatch& dispatch_;
+  std::shared_ptr<HVReportingServiceDelegate> delegate_;
+  std::vector<std::shared_ptr<Connection>> connections_;
+  ReporterID target_{0};
+};
+
+void BM_SendMessage(benchmark::State& state, std::int64_t clients, std::int64_t sessions,
+                    std::int64_t history) {
+  Scene scene(clients, sessions);
+  std::int64_t number = 0;
+  const auto fill = [&] {
+    scene.restart();
+    for (std::int64_t held = 0; held < history; ++held) {
+      scene.send(makeMessage(++number));
+      if (held % kBatch == 0) scene.runAll();
+    }
+    scene.runAll();
+  };
+  fill();
+  std::int64_t sinceFill = 0;
+  while (state.KeepRunningBatch(kBatch)) {
+    state.PauseTiming();
+    if ((sinceFill += kBatch) > 500'000) {
+      fill();
+      sinceFill = 0;
+    }
+    std::vector<Dictionary> messages = makeMessages(number);
+    number += kBatch;
+    state.ResumeTiming();
+    for (std::size_t index = 0; index < messages.size(); ++index) {
+      scene.send(std::move(messages[index]));
+      if (index % 64 == 63) scene.runAll();  // a window of requests at a time
+    }
+    scene.runAll();
+  }
+  state.SetItemsProcessed(state.iterations());
+}
+
+void BM_SessionSendMessage(benchmark::State& state, bool redundant) {
+  nullPlatform();
+  const auto session =
+      std::make_shared<HVReportingSession>(ReporterID{1}, HVReportingSession::ProcessIdentifiers{});
+  session->start();
+  std::int64_t number = 0;
+  while (state.KeepRunningBatch(kBatch)) {
+    state.PauseTiming();
+    session->stop();
+    session->start();
+    const std::vector<Dictionary> messages = makeMessages(number);
+    number += kBatch;
+    state.ResumeTiming();
+    for (const Dictionary& message : messages) {
+      session->sendMessage(redundant ? messages.front() : message, AudioEventCategory::kPlayback,
+                           AudioEventType::kState, nullptr);
+    }
+  }
+  state.SetItemsProcessed(state.iterations());
+}
+
+BENCHMARK_CAPTURE(BM_SendMessage, one_session, 1, 1, 0);
+BENCHMARK_CAPTURE(BM_SendMessage, of_10000_sessions, 1, 10'000, 0);
+BENCHMARK_CAPTURE(BM_SendMessage, of_1000_clients, 1'000, 1, 0);
+BENCHMARK_CAPTURE(BM_SendMessage, after_1000000_messages, 1, 1, 1'000'000);
+BENCHMARK_CAPTURE(BM_SessionSendMessage, recorded, false);
+BENCHMARK_CAPTURE(BM_SessionSendMessage, redundant, true);
+
+}  // namespace
+}  // namespace halvox
