@@ -1,0 +1,101 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <string_view>
+#include <vector>
+
+#include "platform/analytics.h"
+#include "platform/linux/store/EventNames.h"
+#include "platform/linux/store/PayloadEncoder.h"
+#include "platform/linux/store/RecordCounters.h"
+#include "platform/linux/store/RecordKind.h"
+#include "platform/linux/store/StoreLog.h"
+#include "platform/linux/store/WriterQueue.h"
+#include "platform/statistics.h"
+
+namespace halvox::platform::linux_ {
+
+// The analytics events of the store. Two events in a row whose payloads are equal, as each message
+// makes them, share one record: the payload is encoded and stored once.
+// Any thread may add; the rest is called by the writer.
+class AnalyticsRecords final : public RecordKind {
+ public:
+  // Does not own its arguments, which must outlive it. `longestPayload` in bytes.
+  AnalyticsRecords(EventNames& names, WriterQueue& queue, StatisticsService& statistics,
+                   std::uint64_t longestPayload);
+
+  // Queues an event of that time (seconds since 1970). Waits while the queue is full.
+  void add(double time, std::string_view name, AnalyticsPayloadBuilder builder);
+
+  [[nodiscard]] SqliteCode prepare(Database& database) override;
+  void release() override;
+  void takeQueued() override;
+  [[nodiscard]] bool hasTaken() const override { return next_ < taken_.size(); }
+  [[nodiscard]] SqliteCode write(TransactionAllowance& allowance) override;
+  void onCommitted() override;
+  std::uint64_t dropTaken(DropReason reason) override;
+  [[nodiscard]] SqliteCode deleteOldest(bool& found) override;
+  [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) override;
+
+ private:
+  struct Event {
+    double time;
+    EventName* name;
+    std::unique_ptr<EventName> ownName;  // the name, when the table had no room for it
+    AnalyticsPayloadBuilder builder;
+  };
+  struct Statements {
+    Statement insertRecord;
+    Statement insertName;
+    Statement findName;
+    Statement noteSpan;
+    Statement oldestRecord;
+    Statement deleteRecords;
+    Statement deleteEmptySpans;
+    Statement agedSpan;
+    Statement deleteAgedRecords;
+    Statement shortenSpan;
+  };
+  // The times of a run of records; see the schema.
+  struct Span {
+    std::int64_t number = -1;
+    double firstTime = 0;
+    double lastTime = 0;
+  };
+
+  [[nodiscard]] SqliteCode writeNext(TransactionAllowance& allowance);
+  [[nodiscard]] SqliteCode insert(const Event& event, const Event* twin, std::string_view payload);
+  [[nodiscard]] SqliteCode identify(EventName& name);
+  [[nodiscard]] SqliteCode noteTime(double time);
+  [[nodiscard]] SqliteCode flushSpan();
+  [[nodiscard]] SqliteCode readNextRecordID(Database& database);
+  Dictionary build(std::size_t index);
+  void endTransaction();
+
+  EventNames& names_;
+  WriterQueue& queue_;
+  RecordCounters counters_;
+  const std::uint64_t longestPayload_;
+
+  std::vector<Event> queued_;  // under the queue's lock
+
+  // The writer's. Events before next_ are written, and their memory is given back.
+  std::vector<Event> taken_;
+  std::size_t next_ = 0;
+  PayloadEncoder encoder_;
+  Dictionary lookedAhead_;  // the payload of the next event, when it was built for comparison
+  bool hasLookedAhead_ = false;
+  Statements statements_;
+  std::int64_t nextRecordID_ = 1;
+  std::int64_t nextCommittedRecordID_ = 1;
+  Span span_;
+  // Names that a failed transaction or a lost database had numbered are numbered anew.
+  std::uint64_t generation_ = 1;
+  std::uint64_t written_ = 0;       // events of the open transaction
+  std::uint64_t writtenBytes_ = 0;  // and their payloads
+  std::uint64_t tooLarge_ = 0;      // of them not stored
+  OncePerSecond tooLargeLines_;
+};
+
+}  // namespace halvox::platform::linux_

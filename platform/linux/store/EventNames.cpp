@@ -1,0 +1,50 @@
+#include "platform/linux/store/EventNames.h"
+
+#include <algorithm>
+#include <functional>
+#include <utility>
+
+#include <fnmatch.h>
+
+namespace halvox::platform::linux_ {
+
+EventNames::EventNames(std::vector<std::string> wantedPatterns)
+    : wantedPatterns_(std::move(wantedPatterns)),
+      slots_(std::make_unique<std::atomic<EventName*>[]>(kSlots)) {}
+
+EventNames::~EventNames() {
+  for (std::size_t index = 0; index < kSlots; ++index) {
+    const std::unique_ptr<EventName> owned(slots_[index].load(std::memory_order_relaxed));
+  }
+}
+
+EventName* EventNames::find(std::string_view name) {
+  std::unique_ptr<EventName> made;
+  std::size_t index = std::hash<std::string_view>{}(name) % kSlots;
+  while (true) {
+    EventName* present = slots_[index].load(std::memory_order_acquire);
+    if (present == nullptr) {
+      if (made == nullptr) {
+        // Threads that count past the bound together overshoot it by their number at most.
+        if (count_.load(std::memory_order_relaxed) >= kMostNames) return nullptr;
+        made = std::make_unique<EventName>(name, matches(name));
+      }
+      if (slots_[index].compare_exchange_strong(present, made.get(), std::memory_order_acq_rel)) {
+        count_.fetch_add(1, std::memory_order_relaxed);
+        return made.release();
+      }
+      // Another thread was first; its entry, now in `present`, may be the very name.
+    }
+    if (present->text == name) return present;
+    index = (index + 1) % kSlots;
+  }
+}
+
+bool EventNames::matches(std::string_view name) const {
+  const std::string text(name);
+  return std::ranges::any_of(wantedPatterns_, [&](const std::string& pattern) {
+    return ::fnmatch(pattern.c_str(), text.c_str(), 0) == 0;
+  });
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,306 @@
+#include "platform/linux/store/PayloadEncoder.h"
+
+#include <algorithm>
+#include <array>
+#include <bit>
+#include <charconv>
+#include <chrono>
+#include <cmath>
+#include <cstdint>
+#include <cstdio>
+#include <cstring>
+#include <span>
+#include <string>
+
+#include <rapidjson/stringbuffer.h>
+#include <rapidjson/writer.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::size_t kKeptBufferBytes = 256 * 1024;
+constexpr std::size_t kLongestNumber = 32;
+constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
+
+// Years beyond these have no RFC 3339 form.
+constexpr double kEarliest = -62135596800.0;  // 0001-01-01
+constexpr double kEnd = 253402300800.0;       // 10000-01-01
+
+enum class TextKind : std::uint8_t { kPlain, kEscapesNeeded, kNotAscii };
+
+// Looks at eight bytes at a time, because nearly all texts are plain.
+TextKind classify(std::string_view text) {
+  constexpr std::uint64_t kOnes = 0x0101010101010101U;
+  constexpr std::uint64_t kHighs = kOnes * 0x80U;
+  std::uint64_t special = 0;
+  std::uint64_t high = 0;
+  const auto look = [&](std::uint64_t word) {
+    const std::uint64_t quotes = word ^ (kOnes * '"');
+    const std::uint64_t backslashes = word ^ (kOnes * '\\');
+    high |= word;
+    // Each term sets the high bit of a byte that is below 0x20, a quote or a backslash.
+    special |= (word - kOnes * 0x20U) & ~word;
+    special |= (quotes - kOnes) & ~quotes;
+    special |= (backslashes - kOnes) & ~backslashes;
+  };
+  const char* at = text.data();
+  std::size_t left = text.size();
+  for (; left >= 8; at += 8, left -= 8) {
+    std::uint64_t word = 0;
+    std::memcpy(&word, at, 8);
+    look(word);
+  }
+  if (left > 0) {
+    std::uint64_t word = kOnes * 'a';
+    std::memcpy(&word, at, left);
+    look(word);
+  }
+  if ((high & kHighs) != 0) return TextKind::kNotAscii;
+  return (special & kHighs) != 0 ? TextKind::kEscapesNeeded : TextKind::kPlain;
+}
+
+// The length of the well-formed UTF-8 sequence that `text` begins with, 0 when there is none.
+std::size_t sequenceLength(std::string_view text) {
+  const auto byte = [&](std::size_t index) { return static_cast<unsigned char>(text[index]); };
+  const unsigned char first = byte(0);
+  if (first < 0x80U) return 1;
+  const std::size_t length = first >= 0xF0U ? 4 : first >= 0xE0U ? 3 : 2;
+  if (first < 0xC2U || first > 0xF4U || text.size() < length) return 0;
+  for (std::size_t index = 1; index < length; ++index) {
+    if ((byte(index) & 0xC0U) != 0x80U) return 0;
+  }
+  // Overlong forms, surrogates and what lies beyond the last code point show in the second byte.
+  const unsigned char second = byte(1);
+  if (first == 0xE0U && second < 0xA0U) return 0;
+  if (first == 0xEDU && second > 0x9FU) return 0;
+  if (first == 0xF0U && second < 0x90U) return 0;
+  if (first == 0xF4U && second > 0x8FU) return 0;
+  return length;
+}
+
+std::string wellFormed(std::string_view text) {
+  std::string result;
+  result.reserve(text.size());
+  while (!text.empty()) {
+    const std::size_t length = sequenceLength(text);
+    result += length == 0 ? kReplacement : text.substr(0, length);
+    text.remove_prefix(std::max<std::size_t>(length, 1));
+  }
+  return result;
+}
+
+// "2023-11-14T22:13:20.250000Z" into `buffer`.
+std::string_view dateText(double secondsSince1970, std::span<char, 64> buffer) {
+  using namespace std::chrono;
+  const auto rounded = microseconds{std::llround(secondsSince1970 * 1e6)};
+  const sys_time<microseconds> time{
+      std::min(rounded, duration_cast<microseconds>(duration<double>(kEnd)) - microseconds(1))};
+  const auto day = floor<days>(time);
+  const year_month_day calendar{day};
+  const hh_mm_ss clock{time - day};
+  const int length = std::snprintf(
+      buffer.data(), buffer.size(), "%04d-%02u-%02uT%02d:%02d:%02d.%06dZ",
+      static_cast<int>(calendar.year()), static_cast<unsigned>(calendar.month()),
+      static_cast<unsigned>(calendar.day()), static_cast<int>(clock.hours().count()),
+      static_cast<int>(clock.minutes().count()), static_cast<int>(clock.seconds().count()),
+      static_cast<int>(clock.subseconds().count()));
+  return {buffer.data(), static_cast<std::size_t>(length)};
+}
+
+std::string base64(std::span<const std::byte> bytes) {
+  constexpr std::string_view kAlphabet =
+      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
+  std::string text;
+  text.reserve((bytes.size() + 2) / 3 * 4);
+  for (std::size_t index = 0; index < bytes.size(); index += 3) {
+    const auto group = bytes.subspan(index, std::min<std::size_t>(3, bytes.size() - index));
+    std::uint32_t bits = 0;
+    for (std::size_t at = 0; at < 3; ++at) {
+      bits = bits << 8U | (at < group.size() ? std::to_integer<std::uint32_t>(group[at]) : 0U);
+    }
+    for (std::size_t at = 0; at < 4; ++at) {
+      text += at <= group.size() ? kAlphabet[bits >> (18U - 6U * at) & 63U] : '=';
+    }
+  }
+  return text;
+}
+
+bool alike(const Value& left, const Value& right);
+
+bool alikeNumbers(const Value& left, const Value& right) {
+  if (left.numberKind() != right.numberKind()) return false;
+  switch (left.numberKind()) {
+    case NumberKind::kFloat:
+    case NumberKind::kDouble:
+      // Bit by bit, because 0.0 and -0.0 are equal but not the same text.
+      return std::bit_cast<std::uint64_t>(left.toDouble()) ==
+             std::bit_cast<std::uint64_t>(right.toDouble());
+    case NumberKind::kUInt64:
+      return left.toUInt64() == right.toUInt64();
+    case NumberKind::kBool:
+    case NumberKind::kUInt8:
+    case NumberKind::kInt16:
+    case NumberKind::kUInt16:
+    case NumberKind::kInt32:
+    case NumberKind::kUInt32:
+    case NumberKind::kInt64:
+      return left.toInt64() == right.toInt64();
+  }
+  return false;
+}
+
+bool alike(const Value& left, const Value& right) {
+  if (left.kind() != right.kind()) return false;
+  switch (left.kind()) {
+    case ValueKind::kNone:
+      return true;
+    case ValueKind::kNumber:
+      return alikeNumbers(left, right);
+    case ValueKind::kString:
+      return left.string() == right.string();
+    case ValueKind::kDate:
+      return left.date() == right.date();
+    case ValueKind::kData:
+      return left.data() == right.data();
+    case ValueKind::kArray:
+      return std::ranges::equal(left.array(), right.array(), alike);
+    case ValueKind::kDictionary:
+      return encodeAlike(left.dictionary(), right.dictionary());
+  }
+  return false;
+}
+
+}  // namespace
+
+// RapidJSON's writer with shorter ways for plain texts and for numbers, which it writes a character
+// at a time.
+class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> {
+ public:
+  Text() { Reset(buffer_); }
+
+  std::string_view write(const Dictionary& payload) {
+    if (buffer_.stack_.GetCapacity() > kKeptBufferBytes) buffer_ = rapidjson::StringBuffer();
+    buffer_.Clear();
+    Reset(buffer_);
+    add(payload);
+    return {buffer_.GetString(), buffer_.GetSize()};
+  }
+
+ private:
+  void add(const Dictionary& dictionary) {
+    StartObject();
+    for (const Dictionary::Entry& entry : dictionary) {
+      add(entry.key.text());
+      add(entry.value);
+    }
+    EndObject();
+  }
+
+  void add(const Array& array) {
+    StartArray();
+    for (const Value& value : array) add(value);
+    EndArray();
+  }
+
+  void add(const Value& value) {
+    switch (value.kind()) {
+      case ValueKind::kNone:
+        Null();
+        return;
+      case ValueKind::kNumber:
+        return addNumber(value);
+      case ValueKind::kString:
+        return add(value.string());
+      case ValueKind::kDate:
+        return addDate(value.date());
+      case ValueKind::kData:
+        return addPlain(base64(value.data().bytes()));
+      case ValueKind::kArray:
+        return add(value.array());
+      case ValueKind::kDictionary:
+        return add(value.dictionary());
+    }
+  }
+
+  void add(std::string_view text) {
+    switch (classify(text)) {
+      case TextKind::kPlain:
+        return addPlain(text);
+      case TextKind::kEscapesNeeded:
+        return addEscaped(text);
+      case TextKind::kNotAscii:
+        return addEscaped(wellFormed(text));
+    }
+  }
+
+  void addPlain(std::string_view text) {
+    Prefix(rapidjson::kStringType);
+    char* out = buffer_.Push(text.size() + 2);
+    *out = '"';
+    std::memcpy(out + 1, text.data(), text.size());
+    out[text.size() + 1] = '"';
+  }
+
+  void addEscaped(std::string_view text) {
+    String(text.data(), static_cast<rapidjson::SizeType>(text.size()));
+  }
+
+  void addNumber(const Value& value) {
+    switch (value.numberKind()) {
+      case NumberKind::kBool:
+        Bool(value.toBool());
+        return;
+      case NumberKind::kFloat:
+        return addReal(static_cast<float>(value.toDouble()));
+      case NumberKind::kDouble:
+        return addReal(value.toDouble());
+      case NumberKind::kUInt8:
+      case NumberKind::kUInt16:
+      case NumberKind::kUInt32:
+      case NumberKind::kUInt64:
+        return addDecimal(value.toUInt64());
+      case NumberKind::kInt16:
+      case NumberKind::kInt32:
+      case NumberKind::kInt64:
+        return addDecimal(value.toInt64());
+    }
+  }
+
+  template <typename Real>
+  void addReal(Real number) {
+    if (std::isnan(number)) return addPlain("NaN");
+    if (std::isinf(number)) return addPlain(number > 0 ? "Infinity" : "-Infinity");
+    addDecimal(number);
+  }
+
+  template <typename Number>
+  void addDecimal(Number number) {
+    Prefix(rapidjson::kNumberType);
+    char* const out = buffer_.Push(kLongestNumber);
+    const char* const end = std::to_chars(out, out + kLongestNumber, number).ptr;
+    buffer_.Pop(kLongestNumber - static_cast<std::size_t>(end - out));
+  }
+
+  void addDate(Date date) {
+    const double seconds = date.secondsSince1970;
+    if (!(seconds >= kEarliest && seconds < kEnd)) return addReal(seconds);
+    std::array<char, 64> buffer;
+    addPlain(dateText(seconds, buffer));
+  }
+
+  rapidjson::StringBuffer buffer_;
+};
+
+PayloadEncoder::PayloadEncoder() : text_(std::make_unique<Text>()) {}
+PayloadEncoder::~PayloadEncoder() = default;
+
+std::string_view PayloadEncoder::encode(const Dictionary& payload) { return text_->write(payload); }
+
+bool encodeAlike(const Dictionary& left, const Dictionary& right) {
+  if (left.isIdenticalTo(right)) return true;
+  return std::ranges::equal(left, right, [](const auto& one, const auto& other) {
+    return one.key == other.key && alike(one.value, other.value);
+  });
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,126 @@
+#include "platform/linux/store/Retention.h"
+
+#include <string>
+#include <string_view>
+#include <utility>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::chrono::minutes kAgeInterval{1};
+// Steps in one transaction: few enough that waiting records are not held up, enough to keep up with
+// the fastest writing.
+constexpr int kAgeSteps = 16;
+constexpr int kSizeSteps = 128;
+constexpr std::string_view kVacuumPages = "256";
+
+SqliteCode readInteger(Statement& statement, std::uint64_t& value) {
+  const SqliteCode code = statement.step();
+  if (code == SQLITE_ROW) value = static_cast<std::uint64_t>(statement.integer(0));
+  statement.reset();
+  return code == SQLITE_ROW ? SQLITE_OK : code;
+}
+
+// One step of each kind.
+template <typename Step>
+SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
+  found = false;
+  for (RecordKind* const kind : kinds) {
+    bool foundOfKind = false;
+    const SqliteCode code = step(*kind, foundOfKind);
+    if (code != SQLITE_OK) return code;
+    found = found || foundOfKind;
+  }
+  return SQLITE_OK;
+}
+
+}  // namespace
+
+SqliteCode Retention::prepare(Database& database) {
+  pageBytes_ = static_cast<std::uint64_t>(database.queryInteger("PRAGMA page_size").value_or(0));
+  const std::string vacuum = "PRAGMA incremental_vacuum(" + std::string(kVacuumPages) + ")";
+  for (const auto& [statement, sql] :
+       {std::pair<Statement*, std::string_view>{&statements_.begin, "BEGIN IMMEDIATE"},
+        {&statements_.commit, "COMMIT"},
+        {&statements_.rollback, "ROLLBACK"},
+        {&statements_.pages, "PRAGMA page_count"},
+        {&statements_.freePages, "PRAGMA freelist_count"},
+        {&statements_.vacuum, vacuum}}) {
+    const SqliteCode code = database.prepare(sql, *statement);
+    if (code != SQLITE_OK) return code;
+  }
+  return SQLITE_OK;
+}
+
+void Retention::release() { statements_ = {}; }
+
+SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bool& more) {
+  more = false;
+  const bool byAge = std::chrono::steady_clock::now() >= nextByAge_;
+  SqliteCode code = readUse();
+  if (code != SQLITE_OK) return code;
+  if (!byAge && !isFull() && fileBytes() <= limits_.databaseBytes) return SQLITE_OK;
+
+  code = statements_.begin.run();
+  if (code != SQLITE_OK) return code;
+  if (byAge) code = deleteAged(now, kinds, more);
+  if (code == SQLITE_OK) code = deleteForSize(kinds, more);
+  if (code == SQLITE_OK) code = shrinkFile(more);
+  if (code == SQLITE_OK) code = statements_.commit.run();
+  if (code != SQLITE_OK) static_cast<void>(statements_.rollback.run());
+  return code;
+}
+
+bool Retention::isFull() const {
+  // Pages hold a little more than payloads. With this much free, what is written next fills free
+  // pages and the file need not grow.
+  const std::uint64_t reserve = limits_.transactionBytes + limits_.transactionBytes / 4;
+  return (pages_ - freePages_) * pageBytes_ + reserve > limits_.databaseBytes;
+}
+
+SqliteCode Retention::readUse() {
+  const SqliteCode code = readInteger(statements_.pages, pages_);
+  return code == SQLITE_OK ? readInteger(statements_.freePages, freePages_) : code;
+}
+
+SqliteCode Retention::deleteAged(double now, std::span<RecordKind* const> kinds, bool& more) {
+  const double cutoff = now - static_cast<double>(limits_.age.count());
+  for (int step = 0; step < kAgeSteps; ++step) {
+    bool found = false;
+    const SqliteCode code = stepAll(kinds, found, [&](RecordKind& kind, bool& foundOfKind) {
+      return kind.deleteOlderThan(cutoff, foundOfKind);
+    });
+    if (code != SQLITE_OK) return code;
+    if (!found) {
+      nextByAge_ = std::chrono::steady_clock::now() + kAgeInterval;
+      return SQLITE_OK;
+    }
+  }
+  more = true;
+  return SQLITE_OK;
+}
+
+SqliteCode Retention::deleteForSize(std::span<RecordKind* const> kinds, bool& more) {
+  for (int step = 0; step < kSizeSteps; ++step) {
+    SqliteCode code = readUse();
+    if (code != SQLITE_OK || !isFull()) return code;
+    bool found = false;
+    code = stepAll(kinds, found, [](RecordKind& kind, bool& foundOfKind) {
+      return kind.deleteOldest(foundOfKind);
+    });
+    if (code != SQLITE_OK || !found) return code;
+  }
+  more = true;
+  return SQLITE_OK;
+}
+
+SqliteCode Retention::shrinkFile(bool& more) {
+  SqliteCode code = readUse();
+  if (code != SQLITE_OK || fileBytes() <= limits_.databaseBytes || freePages_ == 0) return code;
+  code = statements_.vacuum.run();
+  if (code == SQLITE_OK) code = readUse();
+  more = more || (fileBytes() > limits_.databaseBytes && freePages_ > 0);
+  return code;
+}
+
+}  // namespace halvox::platform::linux_

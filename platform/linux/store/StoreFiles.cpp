@@ -1,0 +1,118 @@
+#include "platform/linux/store/StoreFiles.h"
+
+#include <array>
+#include <cerrno>
+#include <ctime>
+#include <system_error>
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+
+#include "platform/linux/store/StoreSchema.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::string_view kLockFileName = "halvox.lock";
+constexpr std::array<std::string_view, 3> kSuffixes{"", "-wal", "-shm"};
+constexpr mode_t kFileMode = 0640;
+constexpr int kMostNamesTried = 100;
+
+StoreError failure(StoreError::Kind kind, const std::filesystem::path& path, std::string_view what,
+                   int error) {
+  return {kind,
+          path.native() + ": " + std::string(what) + ": " + std::system_category().message(error)};
+}
+
+std::filesystem::path withSuffix(const std::filesystem::path& path, std::string_view suffix) {
+  return path.native() + std::string(suffix);
+}
+
+std::uint64_t sizeOf(const std::filesystem::path& path) {
+  struct stat status {};
+  return ::stat(path.c_str(), &status) == 0 ? static_cast<std::uint64_t>(status.st_size) : 0;
+}
+
+std::string utcStamp() {
+  const std::time_t now = std::time(nullptr);
+  std::tm parts{};
+  ::gmtime_r(&now, &parts);
+  std::array<char, 32> buffer;
+  const std::size_t length = std::strftime(buffer.data(), buffer.size(), "%Y%m%dT%H%M%SZ", &parts);
+  return {buffer.data(), length};
+}
+
+bool anyExists(const std::filesystem::path& base) {
+  for (const std::string_view suffix : kSuffixes) {
+    if (::access(withSuffix(base, suffix).c_str(), F_OK) == 0) return true;
+  }
+  return false;
+}
+
+}  // namespace
+
+std::optional<FileIdentity> fileIdentity(const std::filesystem::path& path) {
+  struct stat status {};
+  if (::stat(path.c_str(), &status) != 0) return std::nullopt;
+  return FileIdentity{status.st_dev, status.st_ino};
+}
+
+StoreFiles::StoreFiles(const std::filesystem::path& directory)
+    : directory_(directory), database_(directory / kStoreFileName) {}
+
+std::optional<StoreError> StoreFiles::claimDirectory() {
+  struct stat status {};
+  if (lock_ && ::fstat(lock_.get(), &status) == 0 && status.st_nlink > 0) return std::nullopt;
+  std::error_code error;
+  std::filesystem::create_directories(directory_, error);
+  if (error) {
+    return failure(StoreError::Kind::kDirectory, directory_, "the directory cannot be made",
+                   error.value());
+  }
+  const std::filesystem::path path = directory_ / kLockFileName;
+  lock_.reset(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, kFileMode));
+  if (!lock_) {
+    return failure(StoreError::Kind::kDirectory, path, "the file cannot be written", errno);
+  }
+  if (::flock(lock_.get(), LOCK_EX | LOCK_NB) == 0) return std::nullopt;
+  const int reason = errno;
+  lock_.reset();
+  if (reason != EWOULDBLOCK) {
+    return failure(StoreError::Kind::kCannotOpen, path, "the file cannot be locked", reason);
+  }
+  return StoreError{StoreError::Kind::kInUse,
+                    database_.native() + ": another service is using this store"};
+}
+
+std::optional<StoreError> StoreFiles::makeDatabaseFile() {
+  if (sizeOf(database_) == 0 && logBytes() > 0) {
+    std::string newName;
+    if (auto error = setAside(newName)) return error;
+  }
+  const UniqueFd made(::open(database_.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, kFileMode));
+  if (made || errno == EEXIST) return std::nullopt;
+  return failure(StoreError::Kind::kDirectory, database_, "the file cannot be made", errno);
+}
+
+std::optional<StoreError> StoreFiles::setAside(std::string& newName) {
+  const std::string wanted = database_.native() + ".damaged-" + utcStamp();
+  newName = wanted;
+  for (int number = 2; anyExists(newName) && number < kMostNamesTried; ++number) {
+    newName = wanted + "-" + std::to_string(number);
+  }
+  for (const std::string_view suffix : kSuffixes) {
+    const auto from = withSuffix(database_, suffix);
+    if (::rename(from.c_str(), withSuffix(newName, suffix).c_str()) == 0 || errno == ENOENT) {
+      continue;
+    }
+    return failure(StoreError::Kind::kDirectory, from, "the file cannot be renamed", errno);
+  }
+  return std::nullopt;
+}
+
+std::optional<FileIdentity> StoreFiles::identity() const { return fileIdentity(database_); }
+
+std::uint64_t StoreFiles::logBytes() const { return sizeOf(withSuffix(database_, "-wal")); }
+
+}  // namespace halvox::platform::linux_

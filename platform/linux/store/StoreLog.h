@@ -1,0 +1,30 @@
+#pragma once
+
+#include <chrono>
+
+#include "platform/log.h"
+#include "platform/services.h"
+
+namespace halvox::platform::linux_ {
+
+// The log category of everything in this folder.
+inline LogCategory& storeCategory() {
+  static LogCategory& category = log().createCategory("com.tarno.halvox", "store");
+  return category;
+}
+
+// Keeps a line that could come with every record from being logged more than once a second.
+class OncePerSecond {
+ public:
+  [[nodiscard]] bool tryPass() {
+    const auto now = std::chrono::steady_clock::now();
+    if (now < next_) return false;
+    next_ = now + std::chrono::seconds(1);
+    return true;
+  }
+
+ private:
+  std::chrono::steady_clock::time_point next_{};
+};
+
+}  // namespace halvox::platform::linux_

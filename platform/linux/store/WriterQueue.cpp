@@ -1,0 +1,90 @@
+#include "platform/linux/store/WriterQueue.h"
+
+#include <algorithm>
+
+namespace halvox::platform::linux_ {
+
+WriterQueue::WriterQueue(const QueueLimits& limits, Backpressure& backpressure)
+    : limits_(limits),
+      backpressure_(backpressure),
+      softRecords_(limits.softRecords),
+      gatherRecords_(limits.gatherRecords) {}
+
+void WriterQueue::close() {
+  {
+    const MutexLock lock(mutex_);
+    closed_ = true;
+  }
+  work_.notifyAll();
+  room_.notifyAll();
+}
+
+bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
+  const MutexLock lock(mutex_);
+  while (queued_ == 0 && !closed_) {
+    writer_ = Writer::kIdle;
+    work_.wait(mutex_);
+  }
+  while (queued_ < gatherRecords_ && !closed_ && std::chrono::steady_clock::now() < notBefore) {
+    writer_ = Writer::kGathering;
+    work_.waitUntil(mutex_, notBefore);
+  }
+  writer_ = Writer::kWorking;
+  if (queued_ == 0) return false;
+  take();
+  queued_ = 0;
+  return true;
+}
+
+void WriterQueue::finish(std::uint64_t records, std::uint64_t bytes) {
+  bool wakeCallers = false;
+  bool relieve = false;
+  {
+    const MutexLock lock(mutex_);
+    waiting_ -= records;
+    estimate(records, bytes);
+    wakeCallers = callersWaiting_ > 0;
+    relieve = backpressure_.isHigh() && waiting_ <= softRecords_ / 4;
+  }
+  if (wakeCallers) room_.notifyAll();
+  if (relieve) backpressure_.relieve();
+}
+
+bool WriterQueue::hasQueued() {
+  const MutexLock lock(mutex_);
+  return queued_ > 0;
+}
+
+std::uint64_t WriterQueue::waiting() {
+  const MutexLock lock(mutex_);
+  return waiting_;
+}
+
+void WriterQueue::waitForRoom() {
+  ++callersWaiting_;
+  room_.wait(mutex_);
+  --callersWaiting_;
+}
+
+bool WriterQueue::noteAdded() {
+  ++queued_;
+  ++waiting_;
+  if (waiting_ >= softRecords_ && !backpressure_.isHigh()) backpressure_.raise();
+  const bool wake =
+      writer_ == Writer::kIdle || (writer_ == Writer::kGathering && queued_ >= gatherRecords_);
+  // Woken once is enough, however many come before it runs.
+  if (wake) writer_ = Writer::kWorking;
+  return wake;
+}
+
+void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {
+  if (records == 0) return;
+  // Rises at once and falls slowly: what waits is more likely like the largest seen lately.
+  bytesPerRecord_ = std::max(bytes / records, bytesPerRecord_ - bytesPerRecord_ / 4);
+  const std::uint64_t bySize = limits_.softBytes / std::max<std::uint64_t>(bytesPerRecord_, 1);
+  softRecords_ = std::clamp<std::uint64_t>(bySize, 1, limits_.softRecords);
+  // Gathering must end before callers have to wait.
+  gatherRecords_ = std::clamp<std::uint64_t>(softRecords_ / 2, 1, limits_.gatherRecords);
+}
+
+}  // namespace halvox::platform::linux_
