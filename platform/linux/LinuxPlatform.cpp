@@ -1,0 +1,171 @@
+#include "platform/linux/LinuxPlatform.h"
+
+#include <utility>
+#include <variant>
+
+#include <sysexits.h>
+
+#include "platform/log.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// How long the end of the service waits for jobs that run.
+constexpr std::chrono::seconds kJobsEndWithin{5};
+
+LogCategory& mainCategory() {
+  static LogCategory& category = platform::log().createCategory("com.tarno.halvox", "main");
+  return category;
+}
+
+constexpr UnitLog kLog(mainCategory, "LinuxPlatform");
+
+ConnectionOptions connectionOptions(const Configuration& configuration) {
+  ConnectionOptions options;
+  options.socket = configuration.listener.socket;
+  options.bus = configuration.listener.bus;
+  options.handshakeTimeout = configuration.listener.handshakeTimeout;
+  options.messageTimeout = configuration.listener.messageTimeout;
+  options.clientHistoryMegabytes = configuration.limits.clientHistoryMegabytes;
+  options.clientSessions = configuration.limits.clientSessions;
+  return options;
+}
+
+StoreOptions storeOptions(const Configuration& configuration) {
+  StoreOptions options;
+  options.directory = configuration.storage.directory;
+  options.retentionDays = configuration.storage.retentionDays;
+  options.maxMegabytes = configuration.storage.maxMegabytes;
+  options.wantedEvents = configuration.analytics.wanted;
+  return options;
+}
+
+std::unique_ptr<KdebugService> makeKdebug(std::string& failure) {
+  const std::filesystem::path module = LttngKdebugService::modulePath();
+  if (module.empty()) {
+    failure = "not in this build";
+    return std::make_unique<NoKdebugService>();
+  }
+  auto loaded = LttngKdebugService::load(module);
+  if (auto* service = std::get_if<std::unique_ptr<KdebugService>>(&loaded)) {
+    return std::move(*service);
+  }
+  failure = std::get<std::string>(loaded);
+  return std::make_unique<NoKdebugService>();
+}
+
+int exitStatus(StoreError::Kind kind) {
+  switch (kind) {
+    case StoreError::Kind::kDirectory:
+      return EX_CANTCREAT;
+    case StoreError::Kind::kInUse:
+      return EX_UNAVAILABLE;
+    case StoreError::Kind::kNewerVersion:
+      return EX_DATAERR;
+    case StoreError::Kind::kMissing:
+    case StoreError::Kind::kDamaged:
+    case StoreError::Kind::kCannotOpen:
+      return EX_IOERR;
+  }
+  return EX_SOFTWARE;
+}
+
+int exitStatus(ConnectionOpenError::Kind kind) {
+  switch (kind) {
+    case ConnectionOpenError::Kind::kPathTooLong:
+      return EX_CONFIG;
+    case ConnectionOpenError::Kind::kDirectoryMissing:
+    case ConnectionOpenError::Kind::kDirectoryNotWritable:
+    case ConnectionOpenError::Kind::kNotASocket:
+      return EX_CANTCREAT;
+    case ConnectionOpenError::Kind::kAlreadyServed:
+    case ConnectionOpenError::Kind::kBusUnreachable:
+    case ConnectionOpenError::Kind::kBusNameTaken:
+      return EX_UNAVAILABLE;
+    case ConnectionOpenError::Kind::kBadActivation:
+      return EX_USAGE;
+    case ConnectionOpenError::Kind::kSystem:
+      return EX_OSERR;
+  }
+  return EX_SOFTWARE;
+}
+
+const char* busName(BusKind kind) {
+  switch (kind) {
+    case BusKind::kNone:
+      return "none";
+    case BusKind::kSession:
+      return "session";
+    case BusKind::kSystem:
+      return "system";
+  }
+  return "";
+}
+
+}  // namespace
+
+LinuxPlatform::LinuxPlatform(const Configuration& configuration)
+    : configuration_(configuration),
+      connections_(
+          [this] {
+            ConnectionOptions options = connectionOptions(configuration_);
+            options.beginBatch = [this] { dispatch_.beginHelping(); };
+            options.endBatch = [this] { dispatch_.endHelping(); };
+            return options;
+          }(),
+          backpressure_),
+      kdebug_(makeKdebug(kdebugFailure_)),
+      log_(SpdlogLogService::onStandardError(configuration_.logLevel, statistics_)),
+      deviceProperties_(configuration_.device),
+      featureFlags_(configuration_.features),
+      store_(storeOptions(configuration_), {clock_, statistics_, backpressure_}),
+      analytics_(store_, clock_),
+      dispatch_(*log_, statistics_) {}
+
+Services LinuxPlatform::services() {
+  return {.analytics = analytics_,
+          .clock = clock_,
+          .connections = connections_,
+          .deviceProperties = deviceProperties_,
+          .dispatch = dispatch_,
+          .featureFlags = featureFlags_,
+          .kdebug = *kdebug_,
+          .log = *log_,
+          .process = process_,
+          .statistics = statistics_};
+}
+
+std::optional<StartFailure> LinuxPlatform::open() {
+  if (const auto error = store_.open()) {
+    return StartFailure{exitStatus(error->kind), error->description};
+  }
+  if (const auto error = connections_.open()) {
+    return StartFailure{exitStatus(error->kind), error->description};
+  }
+  logStart();
+  return std::nullopt;
+}
+
+bool LinuxPlatform::close() {
+  const bool ended = dispatch_.stop(kJobsEndWithin);
+  store_.close();
+  logStatistics();
+  log_->stop();
+  return ended;
+}
+
+void LinuxPlatform::logStart() const {
+  kLog.notice("serving ", configuration_.listener.socket.string(), ", bus ",
+              busName(configuration_.listener.bus), ", store ",
+              configuration_.storage.directory.string());
+  kLog.notice("trace points: ", kdebugFailure_.empty() ? "LTTng" : "none, LTTng " + kdebugFailure_);
+}
+
+void LinuxPlatform::logStatistics() const {
+  for (const CounterReading& reading : statistics_.snapshot()) {
+    if (reading.value == 0) continue;
+    kLog.info("counted ", reading.piece, ", ", reading.name, ": ", reading.value);
+  }
+}
+
+}  // namespace halvox::platform::linux_

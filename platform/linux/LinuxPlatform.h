@@ -1,0 +1,71 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/linux/connection/LinuxConnectionService.h"
+#include "platform/linux/runtime/AsioDispatchService.h"
+#include "platform/linux/runtime/Backpressure.h"
+#include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/runtime/ConfiguredDevicePropertyService.h"
+#include "platform/linux/runtime/ConfiguredFeatureFlagService.h"
+#include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/runtime/LibcClockService.h"
+#include "platform/linux/runtime/LttngKdebugService.h"
+#include "platform/linux/runtime/ProcfsProcessService.h"
+#include "platform/linux/runtime/SpdlogLogService.h"
+#include "platform/linux/store/SqliteAnalyticsService.h"
+#include "platform/linux/store/SqliteStore.h"
+#include "platform/services.h"
+
+namespace halvox::platform::linux_ {
+
+// Why the service cannot start: one line for the user, and the exit status that tells scripts
+// which kind of reason it was (those of sysexits.h).
+struct StartFailure {
+  int exitStatus;
+  std::string description;
+};
+
+// All Linux adapters of one process, made from its configuration. Belongs to the main thread.
+//
+//   made --open()--> serving --close()--> closed
+class LinuxPlatform {
+ public:
+  // Starts the threads of the log and of the queues; nothing outside the process is touched yet.
+  explicit LinuxPlatform(const Configuration& configuration);
+  LinuxPlatform(const LinuxPlatform&) = delete;
+  LinuxPlatform& operator=(const LinuxPlatform&) = delete;
+
+  [[nodiscard]] Services services();
+  // Opens the store, then the socket, so that nothing is accepted that could not be kept.
+  // The services must be installed.
+  [[nodiscard]] std::optional<StartFailure> open();
+  // Ends the queues, writes what waits for the store, and tells the statistics in the log. False
+  // when a job would not end: the process must then end without destroying anything.
+  [[nodiscard]] bool close();
+
+ private:
+  void logStart() const;
+  void logStatistics() const;
+
+  // In the order in which they need each other. The connections come before all that has threads,
+  // because they take the end signals from every thread that starts after them.
+  const Configuration configuration_;
+  CounterStatisticsService statistics_;
+  Backpressure backpressure_;
+  LinuxConnectionService connections_;
+  std::string kdebugFailure_;
+  std::unique_ptr<KdebugService> kdebug_;
+  std::unique_ptr<SpdlogLogService> log_;
+  LibcClockService clock_;
+  ProcfsProcessService process_;
+  ConfiguredDevicePropertyService deviceProperties_;
+  ConfiguredFeatureFlagService featureFlags_;
+  SqliteStore store_;
+  SqliteAnalyticsService analytics_;
+  AsioDispatchService dispatch_;
+};
+
+}  // namespace halvox::platform::linux_
