@@ -56,9 +56,9 @@ struct Invocation {
   ReplyCallback reply;  // never empty; does nothing when the client wants no answer
 };
 
-// Whether a request can make the service hold more; such requests are refused while the client is
-// over its bounds.
-enum class MethodEffect : std::uint8_t { kMayHoldMore, kHoldsNoMore };
+// Whether a request can make the service hold more. Such requests are refused while the client's
+// sessions hold too many bytes; those that make a session also while it has too many of these.
+enum class MethodEffect : std::uint8_t { kMayHoldMore, kHoldsNoMore, kMakesSession };
 
 // One method of an interface: its name, the D-Bus signatures of what goes in and out, and the
 // function that hands a request to the object. `invoke` runs on the connection's thread.

@@ -1,11 +1,27 @@
 #include "platform/linux/connection/wire/Signature.h"
 
+#include <array>
+
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-bool isBasic(char code) {
-  return std::string_view("ybnqiuxtdsogh").find(code) != std::string_view::npos;
+// What a character may be in a signature.
+enum class Role : std::uint8_t { kNone, kBasic, kDescriptor, kVariant };
+
+constexpr std::array<Role, 256> makeRoles() {
+  std::array<Role, 256> roles{};
+  for (const char code : std::string_view("ybnqiuxtdsog")) {
+    roles[static_cast<unsigned char>(code)] = Role::kBasic;
+  }
+  roles['h'] = Role::kDescriptor;
+  roles['v'] = Role::kVariant;
+  return roles;
 }
+constexpr std::array<Role, 256> kRoles = makeRoles();
+
+Role roleOf(char code) { return kRoles[static_cast<unsigned char>(code)]; }
+
+bool isBasic(char code) { return roleOf(code) == Role::kBasic || code == 'h'; }
 
 // Walks over complete types and notes on the way what keeps them from being taken. Recursion is
 // bounded by the length of a signature.
@@ -17,14 +33,15 @@ class TypeScanner {
 
   // False when no complete type starts here.
   bool scanType(unsigned arrays, unsigned structs) {
-    if (arrays > kMaxSignatureNesting || structs > kMaxSignatureNesting) tooDeep_ = true;
     const char code = next();
+    const Role role = roleOf(code);
+    if (arrays > kMaxSignatureNesting || structs > kMaxSignatureNesting) tooDeep_ = true;
     if (code == 'a') {
       return peek() == '{' ? scanEntry(arrays + 1, structs + 1) : scanType(arrays + 1, structs);
     }
     if (code == '(') return scanStruct(arrays, structs + 1);
-    if (code == 'h') unsupported_ = true;
-    return code == 'v' || isBasic(code);
+    if (role == Role::kDescriptor) unsupported_ = true;
+    return role != Role::kNone;
   }
 
   [[nodiscard]] SignatureShape shape() const {
@@ -74,6 +91,8 @@ SignatureShape shapeOfSignature(std::string_view signature) {
 }
 
 SignatureShape shapeOfType(std::string_view type) {
+  // Most types are of one character.
+  if (type.size() == 1 && roleOf(type.front()) == Role::kBasic) return SignatureShape::kTaken;
   if (type.size() > kMaxSignatureBytes) return SignatureShape::kBroken;
   TypeScanner scanner(type);
   if (!scanner.scanType(0, 0) || !scanner.atEnd()) return SignatureShape::kBroken;

@@ -18,8 +18,13 @@ constexpr std::size_t kKeptElements = 1024;
 // The elements of containers that are not complete yet, innermost last. A thread keeps one, so that
 // containers can be made in their final size without an allocation besides.
 struct Scratch {
+  struct Entry {
+    Entry(std::string_view text, Value content) : key(text), value(std::move(content)) {}
+    Key key;
+    Value value;
+  };
   std::vector<Value> values;
-  std::vector<Dictionary::Entry> entries;
+  std::vector<Entry> entries;
 
   void clear() {
     values.clear();
@@ -46,43 +51,43 @@ class Decoder {
   [[nodiscard]] DecodeError error() const;
 
  private:
-  bool decode(std::string_view type, unsigned level, Value& value);
-  bool decodeContainer(std::string_view type, unsigned level, Value& value);
-  bool decodeDate(std::string_view type, Value& value);
-  bool decodeVariant(unsigned level, Value& value);
-  bool decodeData(Value& value);
-  bool decodeArray(std::string_view type, unsigned level, Value& value);
-  bool decodeDictionary(std::string_view type, unsigned level, Value& value);
-  bool decodeEntry(std::string_view type, unsigned level);
+  Value decode(std::string_view type, unsigned level);
+  Value decodeContainer(std::string_view type, unsigned level);
+  Value decodeBoolean(std::string_view type);
+  Value decodeDate(std::string_view type);
+  Value decodeVariant(unsigned level);
+  Value decodeData();
+  Value decodeArray(std::string_view type, unsigned level);
+  Value decodeDictionary(std::string_view type, unsigned level);
+  void decodeEntry(std::string_view type, unsigned level);
 
   template <typename Number>
-  bool decodeNumber(std::string_view type, Value& value) {
+  Value decodeNumber(std::string_view type) {
     Number number{};
-    if (!reader_.read(number)) return malformed(type);
-    value = Value(number);
-    return true;
+    return reader_.read(number) ? Value(number) : malformed(type);
   }
   template <typename Read>
-  bool decodeText(std::string_view type, Read read, Value& value) {
+  Value decodeText(std::string_view type, Read read) {
     std::string_view text;
-    if (!(reader_.*read)(text)) return malformed(type);
-    value = Value(text);
-    return true;
+    return (reader_.*read)(text) ? Value(text) : malformed(type);
   }
 
-  bool refuse(Kind kind, std::string_view problem, std::string_view signature) {
+  // Notes what is wrong and gives no value.
+  Value refuse(Kind kind, std::string_view problem, std::string_view signature) {
+    failed_ = true;
     kind_ = kind;
     problem_ = problem;
     signature_ = signature;
-    return false;
+    return {};
   }
-  bool malformed(std::string_view signature) {
+  Value malformed(std::string_view signature) {
     return refuse(Kind::kMalformed, reader_.problem(), signature);
   }
 
   WireReader reader_;
   Scratch& scratch_;  // of the thread
-  // What went wrong, and on the way out of the containers, where.
+  // Whether and what went wrong, and on the way out of the containers, where.
+  bool failed_ = false;
   Kind kind_ = Kind::kMalformed;
   std::string_view problem_;
   std::string_view signature_;
@@ -92,76 +97,78 @@ class Decoder {
 bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& arguments) {
   for (std::string_view rest = types; !rest.empty();) {
     const std::string_view type = rest.substr(0, firstTypeLength(rest));
-    if (!decode(type, 0, arguments.emplace_back())) {
+    arguments.push_back(decode(type, 0));
+    if (failed_) {
       path_.setArgument(arguments.size());
       return false;
     }
     rest.remove_prefix(type.size());
   }
-  return reader_.atLimit() ||
-         refuse(Kind::kMalformed, "there are bytes behind the last argument", types);
+  if (!reader_.atLimit()) {
+    refuse(Kind::kMalformed, "there are bytes behind the last argument", types);
+  }
+  return !failed_;
 }
 
-bool Decoder::decode(std::string_view type, unsigned level, Value& value) {
+Value Decoder::decode(std::string_view type, unsigned level) {
   switch (type.front()) {
     case 'y':
-      return decodeNumber<std::uint8_t>(type, value);
+      return decodeNumber<std::uint8_t>(type);
     case 'n':
-      return decodeNumber<std::int16_t>(type, value);
+      return decodeNumber<std::int16_t>(type);
     case 'q':
-      return decodeNumber<std::uint16_t>(type, value);
+      return decodeNumber<std::uint16_t>(type);
     case 'i':
-      return decodeNumber<std::int32_t>(type, value);
+      return decodeNumber<std::int32_t>(type);
     case 'u':
-      return decodeNumber<std::uint32_t>(type, value);
+      return decodeNumber<std::uint32_t>(type);
     case 'x':
-      return decodeNumber<std::int64_t>(type, value);
+      return decodeNumber<std::int64_t>(type);
     case 't':
-      return decodeNumber<std::uint64_t>(type, value);
+      return decodeNumber<std::uint64_t>(type);
     case 'd':
-      return decodeNumber<double>(type, value);
-    case 'b': {
-      bool boolean = false;
-      if (!reader_.readBoolean(boolean)) return malformed(type);
-      value = Value(boolean);
-      return true;
-    }
+      return decodeNumber<double>(type);
+    case 'b':
+      return decodeBoolean(type);
     case 's':
-      return decodeText(type, &WireReader::readText, value);
+      return decodeText(type, &WireReader::readText);
     case 'o':
-      return decodeText(type, &WireReader::readPath, value);
+      return decodeText(type, &WireReader::readPath);
     case 'g':
-      return decodeText(type, &WireReader::readSignature, value);
+      return decodeText(type, &WireReader::readSignature);
     default:
-      return decodeContainer(type, level + 1, value);
+      return decodeContainer(type, level + 1);
   }
 }
 
-bool Decoder::decodeContainer(std::string_view type, unsigned level, Value& value) {
+Value Decoder::decodeContainer(std::string_view type, unsigned level) {
   if (level > kMaxNesting) {
     return refuse(Kind::kUnsupported, "nesting of more than 64 levels is not taken", type);
   }
-  if (type.front() == 'v') return decodeVariant(level, value);
-  if (type == "ay") return decodeData(value);
-  if (type.starts_with("a{s")) return decodeDictionary(type, level, value);
-  if (type.front() == 'a' && type[1] != '{') return decodeArray(type, level, value);
-  if (type == "(d)") return decodeDate(type, value);
+  if (type.front() == 'v') return decodeVariant(level);
+  if (type == "ay") return decodeData();
+  if (type.starts_with("a{s")) return decodeDictionary(type, level);
+  if (type.front() == 'a' && type[1] != '{') return decodeArray(type, level);
+  if (type == "(d)") return decodeDate(type);
   return refuse(Kind::kUnsupported, "values of this signature are not taken", type);
 }
 
-bool Decoder::decodeDate(std::string_view type, Value& value) {
-  Date date;
-  if (!reader_.align(8) || !reader_.read(date.secondsSince1970)) return malformed(type);
-  value = Value(date);
-  return true;
+Value Decoder::decodeBoolean(std::string_view type) {
+  bool boolean = false;
+  return reader_.readBoolean(boolean) ? Value(boolean) : malformed(type);
 }
 
-bool Decoder::decodeVariant(unsigned level, Value& value) {
+Value Decoder::decodeDate(std::string_view type) {
+  Date date;
+  return reader_.align(8) && reader_.read(date.secondsSince1970) ? Value(date) : malformed(type);
+}
+
+Value Decoder::decodeVariant(unsigned level) {
   std::string_view type;
   if (!reader_.readVariantSignature(type)) return malformed("v");
   switch (shapeOfType(type)) {
     case SignatureShape::kTaken:
-      return decode(type, level, value);
+      return decode(type, level);
     case SignatureShape::kUnsupported:
       return refuse(Kind::kUnsupported, "values of this signature are not taken", type);
     case SignatureShape::kTooDeep:
@@ -172,65 +179,64 @@ bool Decoder::decodeVariant(unsigned level, Value& value) {
   return refuse(Kind::kMalformed, "a variant whose signature is not valid", type);
 }
 
-bool Decoder::decodeData(Value& value) {
+Value Decoder::decodeData() {
   std::size_t outerLimit = 0;
   if (!reader_.enterArray(1, outerLimit)) return malformed("ay");
-  value = Value(Data(reader_.takeRest()));
+  const Data data(reader_.takeRest());
   reader_.leaveArray(outerLimit);
-  return true;
+  return data;
 }
 
-bool Decoder::decodeArray(std::string_view type, unsigned level, Value& value) {
+Value Decoder::decodeArray(std::string_view type, unsigned level) {
   const std::string_view elementType = type.substr(1);
   std::size_t outerLimit = 0;
   if (!reader_.enterArray(alignmentOf(elementType.front()), outerLimit)) return malformed(type);
   const std::size_t first = scratch_.values.size();
   while (!reader_.atLimit()) {
-    Value element;
-    if (!decode(elementType, level, element)) {
-      path_.putBefore(scratch_.values.size() - first);
-      return false;
+    scratch_.values.push_back(decode(elementType, level));
+    if (failed_) {
+      path_.putBefore(scratch_.values.size() - 1 - first);
+      return {};
     }
-    scratch_.values.push_back(std::move(element));
   }
   reader_.leaveArray(outerLimit);
-  value = Value(Array(std::span<const Value>(scratch_.values).subspan(first)));
+  Array array(std::span<const Value>(scratch_.values).subspan(first));
   scratch_.values.resize(first);
-  return true;
+  return array;
 }
 
-bool Decoder::decodeDictionary(std::string_view type, unsigned level, Value& value) {
+Value Decoder::decodeDictionary(std::string_view type, unsigned level) {
   std::size_t outerLimit = 0;
   if (!reader_.enterArray(8, outerLimit)) return malformed(type);
   const std::size_t first = scratch_.entries.size();
-  while (!reader_.atLimit()) {
-    if (!decodeEntry(type, level)) return false;
-  }
+  while (!failed_ && !reader_.atLimit()) decodeEntry(type, level);
+  if (failed_) return {};
   reader_.leaveArray(outerLimit);
 
   Dictionary dictionary;
   dictionary.reserve(scratch_.entries.size() - first);
-  for (auto& entry : std::span(scratch_.entries).subspan(first)) {
+  for (Scratch::Entry& entry : std::span(scratch_.entries).subspan(first)) {
     dictionary.set(entry.key, std::move(entry.value));
   }
   scratch_.entries.erase(scratch_.entries.begin() + static_cast<std::ptrdiff_t>(first),
                          scratch_.entries.end());
-  value = Value(std::move(dictionary));
-  return true;
+  return dictionary;
 }
 
-bool Decoder::decodeEntry(std::string_view type, unsigned level) {
+void Decoder::decodeEntry(std::string_view type, unsigned level) {
   // a{s…}: what is between the key's type and the closing brace.
   const std::string_view valueType = type.substr(3, type.size() - 4);
   std::string_view key;
-  if (!reader_.align(8) || !reader_.readText(key)) return malformed(type);
-  Value value;
-  if (!decode(valueType, level, value)) {
-    path_.putBefore(key);
-    return false;
+  if (!reader_.align(8) || !reader_.readText(key)) {
+    malformed(type);
+    return;
   }
-  scratch_.entries.push_back({Key(key), std::move(value)});
-  return true;
+  Value value = decode(valueType, level);
+  if (failed_) {
+    path_.putBefore(key);
+    return;
+  }
+  scratch_.entries.emplace_back(key, std::move(value));
 }
 
 DecodeError Decoder::error() const {

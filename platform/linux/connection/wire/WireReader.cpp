@@ -3,17 +3,8 @@
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/linux/connection/wire/Names.h"
 #include "platform/linux/connection/wire/Signature.h"
-#include "platform/linux/connection/wire/Utf8.h"
 
 namespace halvox::platform::linux_::dbus {
-
-bool WireReader::takeTerminated(std::size_t length, std::string_view& text) {
-  if (limit_ - position_ <= length) return fail(kEndsTooEarly);
-  if (bytes_[position_ + length] != '\0') return fail("its end is not marked by a NUL");
-  text = {bytes_ + position_, length};
-  position_ += length + 1;
-  return true;
-}
 
 bool WireReader::readBoolean(bool& boolean) {
   std::uint32_t number = 0;
@@ -21,16 +12,6 @@ bool WireReader::readBoolean(bool& boolean) {
   if (number > 1) return fail("a boolean that is neither 0 nor 1");
   boolean = number == 1;
   return true;
-}
-
-bool WireReader::readUncheckedText(std::string_view& text) {
-  std::uint32_t length = 0;
-  return read(length) && takeTerminated(length, text);
-}
-
-bool WireReader::readText(std::string_view& text) {
-  if (!readUncheckedText(text)) return false;
-  return isWireText(text) || fail("text that is not UTF-8 or has a NUL in it");
 }
 
 bool WireReader::readPath(std::string_view& path) {
@@ -41,11 +22,6 @@ bool WireReader::readPath(std::string_view& path) {
 bool WireReader::readSignature(std::string_view& signature) {
   if (!readVariantSignature(signature)) return false;
   return isSignature(signature) || fail("a signature that is not valid");
-}
-
-bool WireReader::readVariantSignature(std::string_view& signature) {
-  std::uint8_t length = 0;
-  return read(length) && takeTerminated(length, signature);
 }
 
 bool WireReader::enterArray(std::size_t elementAlignment, std::size_t& outerLimit) {

@@ -6,6 +6,8 @@
 #include <span>
 #include <string_view>
 
+#include "platform/linux/connection/wire/Utf8.h"
+
 namespace halvox::platform::linux_::dbus {
 
 // Reads the basic types of the wire one after the other from bytes whose first one stands on an
@@ -55,13 +57,22 @@ class WireReader {
   }
 
   bool readBoolean(bool& boolean);
-  bool readText(std::string_view& text);
+  bool readText(std::string_view& text) {
+    if (!readUncheckedText(text)) return false;
+    return isWireText(text) || fail("text that is not UTF-8 or has a NUL in it");
+  }
   // A text whose characters the caller checks by a stricter rule.
-  bool readUncheckedText(std::string_view& text);
+  bool readUncheckedText(std::string_view& text) {
+    std::uint32_t length = 0;
+    return read(length) && takeTerminated(length, text);
+  }
   bool readPath(std::string_view& path);
   bool readSignature(std::string_view& signature);
   // The signature of a variant, whose grammar is not looked at.
-  bool readVariantSignature(std::string_view& signature);
+  bool readVariantSignature(std::string_view& signature) {
+    std::uint8_t length = 0;
+    return read(length) && takeTerminated(length, signature);
+  }
 
   // Reads the length of an array of elements with that alignment and goes to the first of them.
   // Until leaveArray(), nothing can be read past the end of the array.
@@ -84,7 +95,13 @@ class WireReader {
   static std::uint32_t swapBytes(std::uint32_t bits) { return __builtin_bswap32(bits); }
   static std::uint64_t swapBytes(std::uint64_t bits) { return __builtin_bswap64(bits); }
 
-  bool takeTerminated(std::size_t length, std::string_view& text);
+  bool takeTerminated(std::size_t length, std::string_view& text) {
+    if (limit_ - position_ <= length) return fail(kEndsTooEarly);
+    if (bytes_[position_ + length] != '\0') return fail("its end is not marked by a NUL");
+    text = {bytes_ + position_, length};
+    position_ += length + 1;
+    return true;
+  }
 
   const char* bytes_;
   std::size_t position_ = 0;

@@ -1,0 +1,161 @@
+#include "platform/linux/connection/BusConnection.h"
+
+#include <array>
+#include <utility>
+#include <variant>
+
+#include "platform/linux/connection/BusNames.h"
+#include "platform/linux/connection/BusSender.h"
+#include "platform/linux/connection/ConnectionHost.h"
+#include "platform/linux/connection/ConnectionLog.h"
+#include "platform/linux/connection/wire/FrameWriter.h"
+#include "platform/linux/connection/wire/ValueDecoder.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog{connectionCategory, "BusConnection"};
+
+}  // namespace
+
+BusConnection::BusConnection(ConnectionHost& host, BusSession session)
+    : host_(host), stream_(std::move(session.fd), host, *this) {
+  stream_.skipSerials(session.lastSerial);
+  stream_.input().append(session.unused);
+}
+
+BusConnection::~BusConnection() { abandon(); }
+
+void BusConnection::start() {
+  stream_.setReading(true);
+  handleFrames();
+  stream_.input().settle();
+}
+
+void BusConnection::abandon() {
+  lost_ = true;
+  const auto senders = std::exchange(senders_, {});
+  for (const auto& [name, sender] : senders) sender->abandon();
+  stream_.close();
+}
+
+void BusConnection::forget(const BusSender& sender) {
+  const auto found = senders_.find(sender.name());
+  if (found != senders_.end() && found->second.get() == &sender) senders_.erase(found);
+}
+
+void BusConnection::onReadable() {
+  const SocketStream::Read read = stream_.read();
+  handleFrames();
+  stream_.input().settle();
+  if (read == SocketStream::Read::kEnded) lose("it closed the connection");
+}
+
+void BusConnection::onOutputProgress() {
+  if (lost_ || stream_.output().unsentBytes() > kMaxUnreadReplyBytes / 2) return;
+  stream_.setReading(true);
+  if (!std::exchange(someSenderWaits_, false)) return;
+  for (const auto& [name, sender] : senders_) sender->onStreamRoom();
+}
+
+void BusConnection::handleFrames() {
+  while (!lost_) {
+    const FrameBuffer::Next next = stream_.input().next();
+    if (next.state == FrameBuffer::State::kEmpty || next.state == FrameBuffer::State::kPartial) {
+      break;
+    }
+    if (next.state == FrameBuffer::State::kBroken) return lose(next.error.message);
+    next.state == FrameBuffer::State::kOversized ? handleOversized(next) : handleFrame(next);
+    stream_.input().consume(next.totalBytes);
+  }
+  for (const std::shared_ptr<BusSender>& sender : std::exchange(touched_, {})) {
+    sender->deliverReceived();
+  }
+  // The bus takes what it is sent in its own time; until then nothing more is asked of us.
+  if (stream_.output().unsentBytes() >= kMaxUnreadReplyBytes) stream_.setReading(false);
+}
+
+void BusConnection::handleFrame(const FrameBuffer::Next& next) {
+  const std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(next.bytes);
+  if (const auto* error = std::get_if<dbus::WireError>(&read); error != nullptr) {
+    return lose(error->message);
+  }
+  const dbus::Frame& frame = std::get<dbus::Frame>(read);
+  switch (frame.header.type) {
+    case dbus::MessageType::kMethodCall: {
+      std::shared_ptr<BusSender> sender = senderNamed(frame.header.sender);
+      sender->receive(frame.header, next.bytes);
+      if (touched_.empty() || touched_.back() != sender) touched_.push_back(std::move(sender));
+      break;
+    }
+    case dbus::MessageType::kMethodReturn:
+    case dbus::MessageType::kError:
+      handleAnswer(frame);
+      break;
+    case dbus::MessageType::kSignal:
+      handleSignal(frame);
+      break;
+  }
+}
+
+void BusConnection::handleOversized(const FrameBuffer::Next& next) {
+  const std::vector<std::byte> header = FrameBuffer::withoutBody(next);
+  const std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(header);
+  if (const auto* frame = std::get_if<dbus::Frame>(&read); frame != nullptr) {
+    senderNamed(frame->header.sender)->receiveOversized(next);
+  }
+}
+
+void BusConnection::handleSignal(const dbus::Frame& frame) {
+  const dbus::MessageHeader& header = frame.header;
+  const bool isFromBus = header.sender == bus_names::kBus && header.interface == bus_names::kBus;
+  if (!isFromBus || header.member != "NameOwnerChanged") return;
+  std::vector<Value> names;  // the name, its old owner, its new one
+  if (dbus::decodeBody(frame, "sss", names).has_value() || !names[2].string().empty()) return;
+  const auto found = senders_.find(names[0].string());
+  // Held while it ends: its end may make us forget it.
+  if (found != senders_.end()) std::shared_ptr(found->second)->onVanished();
+}
+
+void BusConnection::handleAnswer(const dbus::Frame& frame) {
+  const auto found = questions_.find(frame.header.replySerial);
+  if (found == questions_.end()) return;
+  const std::shared_ptr<BusSender> sender = found->second.lock();
+  questions_.erase(found);
+  if (!sender) return;
+  std::vector<Value> answer;
+  const bool isKnown = frame.header.type == dbus::MessageType::kMethodReturn &&
+                       !dbus::decodeBody(frame, "u", answer).has_value();
+  sender->onProcess(isKnown ? static_cast<ProcessID>(answer[0].toInt64()) : 0);
+}
+
+std::shared_ptr<BusSender> BusConnection::senderNamed(std::string_view name) {
+  const auto found = senders_.find(name);
+  if (found != senders_.end()) return found->second;
+  auto sender = std::make_shared<BusSender>(host_, *this, std::string(name));
+  senders_.emplace(sender->name(), sender);
+  const std::array arguments = {Value(name)};
+  const dbus::CallTarget target{.destination = bus_names::kBus,
+                                .path = bus_names::kBusPath,
+                                .interface = bus_names::kBus,
+                                .member = "GetConnectionUnixProcessID"};
+  const std::uint32_t serial = stream_.nextSerial();
+  if (dbus::appendMethodCall(stream_.output().bytes(), serial, target, "s", arguments)) {
+    questions_.emplace(serial, sender);
+    stream_.outputAdded();
+  }
+  return sender;
+}
+
+void BusConnection::lose(const std::string& why) {
+  if (std::exchange(lost_, true)) return;
+  kLog.error("lost the bus: ", why, "; its ", senders_.size(),
+             " clients are gone, the socket is served on");
+  stream_.setReading(false);
+  const auto senders = senders_;
+  for (const auto& [name, sender] : senders) sender->onBusLost();
+  questions_.clear();
+  stream_.close();
+}
+
+}  // namespace halvox::platform::linux_

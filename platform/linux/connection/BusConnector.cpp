@@ -1,0 +1,204 @@
+#include "platform/linux/connection/BusConnector.h"
+
+#include <cerrno>
+#include <cstring>
+#include <system_error>
+#include <utility>
+
+#include <poll.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include "platform/linux/connection/BusNames.h"
+#include "platform/linux/connection/wire/FrameWriter.h"
+#include "platform/linux/connection/wire/Handshake.h"
+#include "platform/linux/connection/wire/ValueDecoder.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using Kind = ConnectionOpenError::Kind;
+
+constexpr std::chrono::seconds kBusTimeout{5};
+constexpr std::uint32_t kDoNotQueue = 4;    // a flag of RequestName
+constexpr std::uint32_t kPrimaryOwner = 1;  // answers of RequestName
+constexpr std::uint32_t kAlreadyOwner = 4;
+constexpr std::string_view kVanishingNames =
+    "type='signal',sender='org.freedesktop.DBus',interface='org.freedesktop.DBus',"
+    "member='NameOwnerChanged',path='/org/freedesktop/DBus',arg2=''";
+
+std::string systemError(int error) { return std::generic_category().message(error); }
+
+// A connected socket, or an error number.
+std::variant<UniqueFd, int> connectTo(const BusSocket& bus) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  const std::size_t start = bus.space == BusSocket::Space::kAbstract ? 1 : 0;
+  if (bus.name.size() + start >= sizeof address.sun_path) return ENAMETOOLONG;
+  std::memcpy(&address.sun_path[start], bus.name.data(), bus.name.size());
+  // An abstract name ends with the address, the path of a file with a NUL.
+  const std::size_t length = offsetof(sockaddr_un, sun_path) + bus.name.size() + 1;
+  UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
+  if (!fd) return errno;
+  const auto* generic = reinterpret_cast<const sockaddr*>(&address);
+  if (::connect(fd.get(), generic, static_cast<socklen_t>(length)) != 0) return errno;
+  return fd;
+}
+
+}  // namespace
+
+BusConnector::BusConnector(std::string busName)
+    : busName_(std::move(busName)), input_(dbus::kMaxMessageBytes) {}
+
+std::variant<BusSession, ConnectionOpenError> BusConnector::connect(BusKind bus) {
+  deadline_ = std::chrono::steady_clock::now() + kBusTimeout;
+  if (Failure failure = connectToFirst(busAddressOf(bus))) return *std::move(failure);
+  if (Failure failure = authenticate()) return *std::move(failure);
+  const auto ignore = [](const Value&) -> Failure { return std::nullopt; };
+  if (Failure failure = call("Hello", "", {}, "s", ignore)) return *std::move(failure);
+  const std::array rule = {Value(kVanishingNames)};
+  if (Failure failure = call("AddMatch", "s", rule, "", ignore)) return *std::move(failure);
+  if (Failure failure = requestName()) return *std::move(failure);
+  const std::span<const std::byte> rest = input_.unused();
+  kept_.insert(kept_.end(), rest.begin(), rest.end());
+  return BusSession{.fd = std::move(fd_), .unused = std::move(kept_), .lastSerial = lastSerial_};
+}
+
+BusConnector::Failure BusConnector::connectToFirst(const std::string& address) {
+  address_ = address;
+  std::string reasons;
+  for (const BusSocket& socket : parseBusAddress(address)) {
+    std::variant<UniqueFd, int> result = connectTo(socket);
+    if (auto* fd = std::get_if<UniqueFd>(&result); fd != nullptr) {
+      fd_ = std::move(*fd);
+      return std::nullopt;
+    }
+    reasons +=
+        (reasons.empty() ? "" : "; ") + socket.name + ": " + systemError(std::get<int>(result));
+  }
+  return unreachable(reasons.empty() ? "the address names no Unix socket" : reasons);
+}
+
+BusConnector::Failure BusConnector::authenticate() {
+  dbus::ClientHandshake handshake(geteuid());
+  std::string output;
+  handshake.start(output);
+  while (true) {
+    if (Failure failure = send(output)) return failure;
+    output.clear();
+    if (Failure failure = receive()) return failure;
+    const dbus::HandshakeProgress progress = handshake.feed(input_.unused(), output);
+    input_.consume(progress.consumedBytes);
+    input_.settle();
+    switch (progress.state) {
+      case dbus::HandshakeState::kContinue:
+        break;
+      case dbus::HandshakeState::kDone:
+        return send(output);
+      case dbus::HandshakeState::kFailed:
+        return unreachable("the handshake failed: " + progress.error);
+    }
+  }
+}
+
+BusConnector::Failure BusConnector::requestName() {
+  const std::array arguments = {Value(busName_), Value(kDoNotQueue)};
+  return call("RequestName", "su", arguments, "u", [this](const Value& answer) -> Failure {
+    const std::uint64_t owner = answer.toUInt64();
+    if (owner == kPrimaryOwner || owner == kAlreadyOwner) return std::nullopt;
+    return ConnectionOpenError{
+        .kind = Kind::kBusNameTaken,
+        .description = "bus " + address_ + ": the name " + busName_ + " has another owner"};
+  });
+}
+
+BusConnector::Failure BusConnector::call(std::string_view member, std::string_view signature,
+                                         std::span<const Value> arguments,
+                                         std::string_view answerSignature,
+                                         const std::function<Failure(const Value&)>& take) {
+  const dbus::CallTarget target{.destination = bus_names::kBus,
+                                .path = bus_names::kBusPath,
+                                .interface = bus_names::kBus,
+                                .member = member};
+  std::string bytes;
+  if (!dbus::appendMethodCall(bytes, ++lastSerial_, target, signature, arguments)) {
+    return unreachable("a call of " + std::string(member) + " cannot be written");
+  }
+  if (Failure failure = send(bytes)) return failure;
+  std::variant<dbus::Frame, ConnectionOpenError> answer = waitForAnswer(lastSerial_);
+  if (auto* failure = std::get_if<ConnectionOpenError>(&answer); failure != nullptr) {
+    return std::move(*failure);
+  }
+  const dbus::Frame& frame = std::get<dbus::Frame>(answer);
+  if (frame.header.type == dbus::MessageType::kError) {
+    return unreachable(std::string(member) +
+                       " was refused: " + std::string(frame.header.errorName));
+  }
+  std::vector<Value> values;
+  if (dbus::decodeBody(frame, answerSignature, values).has_value()) {
+    return unreachable("the answer to " + std::string(member) + " makes no sense");
+  }
+  return take(values.empty() ? Value() : values.front());
+}
+
+std::variant<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::uint32_t serial) {
+  while (true) {
+    const FrameBuffer::Next next = input_.next();
+    if (next.state == FrameBuffer::State::kBroken) return unreachable(next.error.message);
+    if (next.state != FrameBuffer::State::kFrame) {
+      if (Failure failure = receive()) return *std::move(failure);
+      input_.settle();
+      continue;
+    }
+    answer_.assign(next.bytes.begin(), next.bytes.end());
+    input_.consume(next.totalBytes);
+    std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(answer_);
+    if (auto* error = std::get_if<dbus::WireError>(&read); error != nullptr) {
+      return unreachable(error->message);
+    }
+    const dbus::Frame& frame = std::get<dbus::Frame>(read);
+    if (frame.header.replySerial == serial) return frame;
+    kept_.insert(kept_.end(), answer_.begin(), answer_.end());
+  }
+}
+
+BusConnector::Failure BusConnector::send(std::string_view bytes) {
+  while (!bytes.empty()) {
+    const ssize_t count = ::send(fd_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
+    if (count >= 0) {
+      bytes.remove_prefix(static_cast<std::size_t>(count));
+    } else if (errno != EAGAIN && errno != EINTR) {
+      return unreachable(systemError(errno));
+    } else if (!waitFor(POLLOUT)) {
+      return unreachable("it does not answer in time");
+    }
+  }
+  return std::nullopt;
+}
+
+BusConnector::Failure BusConnector::receive() {
+  if (!waitFor(POLLIN)) return unreachable("it does not answer in time");
+  const std::span<std::byte> room = input_.readInto(scratch_);
+  const ssize_t count = read(fd_.get(), room.data(), room.size());
+  const int error = errno;
+  input_.received(count > 0 ? static_cast<std::size_t>(count) : 0);
+  if (count == 0) return unreachable("it closed the connection");
+  if (count < 0 && error != EAGAIN && error != EINTR) return unreachable(systemError(error));
+  return std::nullopt;
+}
+
+bool BusConnector::waitFor(short events) const {
+  using std::chrono::milliseconds;
+  const auto left = std::chrono::ceil<milliseconds>(deadline_ - std::chrono::steady_clock::now());
+  if (left.count() <= 0) return false;
+  pollfd waiting{.fd = fd_.get(), .events = events, .revents = 0};
+  const int result = poll(&waiting, 1, static_cast<int>(left.count()));
+  return result > 0 || (result < 0 && errno == EINTR);
+}
+
+ConnectionOpenError BusConnector::unreachable(const std::string& why) const {
+  return {.kind = Kind::kBusUnreachable, .description = "bus " + address_ + ": " + why};
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,68 @@
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <variant>
+#include <vector>
+
+#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/connection/BusAddress.h"
+#include "platform/linux/connection/FrameBuffer.h"
+#include "platform/linux/connection/LinuxConnectionService.h"
+#include "platform/linux/connection/wire/Frame.h"
+
+namespace halvox::platform::linux_ {
+
+// A bus on which we have our name.
+struct BusSession {
+  UniqueFd fd;                    // does not block
+  std::vector<std::byte> unused;  // messages that came meanwhile
+  std::uint32_t lastSerial = 0;
+};
+
+// Connects to a bus, once: handshake, Hello, the name, and a match for names that vanish.
+// Waits for the bus, but no longer than kBusTimeout in all.
+class BusConnector {
+ public:
+  explicit BusConnector(std::string busName);
+  BusConnector(const BusConnector&) = delete;
+  BusConnector& operator=(const BusConnector&) = delete;
+
+  std::variant<BusSession, ConnectionOpenError> connect(BusKind bus);
+
+ private:
+  using Failure = std::optional<ConnectionOpenError>;
+
+  Failure connectToFirst(const std::string& address);
+  Failure authenticate();
+  Failure requestName();
+  // Calls a method of the bus; `take` gets the arguments of the answer.
+  Failure call(std::string_view member, std::string_view signature,
+               std::span<const Value> arguments, std::string_view answerSignature,
+               const std::function<Failure(const Value&)>& take);
+  // The answer to call number `serial`, or none when it did not come; other messages are kept.
+  std::variant<dbus::Frame, ConnectionOpenError> waitForAnswer(std::uint32_t serial);
+  Failure send(std::string_view bytes);
+  Failure receive();
+  [[nodiscard]] bool waitFor(short events) const;
+  [[nodiscard]] ConnectionOpenError unreachable(const std::string& why) const;
+
+  std::string busName_;
+  std::string address_;
+  UniqueFd fd_;
+  ReadScratch scratch_;
+  FrameBuffer input_;
+  std::vector<std::byte> answer_;  // the frame that waitForAnswer() found
+  std::vector<std::byte> kept_;
+  std::uint32_t lastSerial_ = 0;
+  std::chrono::steady_clock::time_point deadline_;
+};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,11 @@
+#pragma once
+
+#include <string_view>
+
+// The bus itself, as its clients see it.
+namespace halvox::platform::linux_::bus_names {
+
+inline constexpr std::string_view kBus = "org.freedesktop.DBus";  // its name and its interface
+inline constexpr std::string_view kBusPath = "/org/freedesktop/DBus";
+
+}  // namespace halvox::platform::linux_::bus_names

@@ -1,0 +1,86 @@
+#include "platform/linux/connection/BusSender.h"
+
+#include <utility>
+
+#include "platform/linux/connection/BusConnection.h"
+#include "platform/linux/connection/ConnectionHost.h"
+#include "platform/linux/connection/ConnectionLog.h"
+#include "platform/linux/connection/ErrorNames.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog{connectionCategory, "BusSender"};
+
+}  // namespace
+
+BusSender::BusSender(ConnectionHost& host, BusConnection& bus, std::string name)
+    : ClientConnection(host, host.nextClientNumber(), 0),
+      bus_(bus),
+      name_(std::move(name)),
+      input_(host.options().maxFrameBytes),
+      identity_(*this) {
+  host.handshakes().start(identity_);
+}
+
+std::string BusSender::description() const {
+  return "client " + std::to_string(number()) + " (pid " + std::to_string(processIdentifier()) +
+         ", " + name_ + " on the bus)";
+}
+
+void BusSender::receive(const dbus::MessageHeader& header, std::span<const std::byte> frame) {
+  const std::size_t waiting = input_.unused().size();
+  if (waiting == 0 || waiting + frame.size() <= kMaxWaitingBytesOfSender) {
+    input_.append(frame);
+    return;
+  }
+  host().statistics().requestsReceived.add();
+  refuse(header, Refusal::kTooManyWaiting, error_names::kLimitsExceeded,
+         std::to_string(waiting) + " bytes of earlier requests are still waiting");
+}
+
+void BusSender::receiveOversized(const FrameBuffer::Next& next) { refuseOversized(next); }
+
+void BusSender::deliverReceived() {
+  if (wantsInput()) deliver();
+}
+
+void BusSender::onProcess(ProcessID pid) {
+  if (isKnown_ || hasEnded()) return;
+  isKnown_ = true;
+  identity_.stop();
+  setProcessIdentifier(pid);
+  if (!host().admit(shared_from_this())) return;
+  deliverReceived();
+}
+
+void BusSender::onVanished() {
+  vanished_ = true;
+  deliverReceived();
+}
+
+void BusSender::onBusLost() {
+  // A sender that the delegate has not heard of has no handlers to be called.
+  isKnown_ ? end(Why::kPeerVanished) : abandon();
+}
+
+SocketStream& BusSender::stream() { return bus_.stream(); }
+
+void BusSender::setReading(bool reading) {
+  if (!reading) bus_.noteWaitingSender();
+}
+
+void BusSender::onDelivered(bool /*begun*/, bool /*progress*/) {
+  if (vanished_) end(Why::kPeerVanished);
+}
+
+void BusSender::onFinished() { bus_.forget(*this); }
+
+// The bus passes on nothing that breaks the rules of the wire, so this is one bad request among
+// good ones; the connection is that of all senders.
+void BusSender::onMalformed(const std::string& what) {
+  kLog.error("dropped a message of ", description(), ": it is no D-Bus message: ", what);
+  host().statistics().connectionsMalformed.add();
+}
+
+}  // namespace halvox::platform::linux_

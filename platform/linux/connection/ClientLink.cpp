@@ -1,0 +1,47 @@
+#include "platform/linux/connection/ClientLink.h"
+
+#include <utility>
+
+#include "platform/linux/connection/ClientConnection.h"
+#include "platform/linux/connection/ConnectionLog.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog{connectionCategory, "ReplyTicket"};
+
+}  // namespace
+
+void ReplyTicket::answer(const std::shared_ptr<ReplyTicket>& ticket,
+                         const std::optional<Error>& error, const Value& value) {
+  ConnectionStatistics& statistics = ticket->client_->statistics();
+  statistics.repliesGiven.add();
+  if (ticket->answered_.exchange(true, std::memory_order_relaxed)) {
+    statistics.repliesDroppedSecond.add();
+    kLog.debug("dropped a second reply to request ", ticket->serial_);
+    return;
+  }
+  Inbox& inbox = ticket->client_->inbox();
+  if (inbox.isLoopThread()) {
+    ticket->deliver(error.has_value() ? &*error : nullptr, value);
+    return;
+  }
+  inbox.postReply({.ticket = ticket,
+                   .error = error.has_value() ? std::make_unique<Error>(*error) : nullptr,
+                   .value = value});
+}
+
+void ReplyTicket::deliver(const Error* error, const Value& value) {
+  ClientConnection* connection = client_->connection();
+  if (connection == nullptr) {
+    client_->statistics().repliesDroppedGone.add();
+    return;
+  }
+  if (error != nullptr) {
+    connection->sendServiceError(serial_, *error);
+  } else {
+    connection->sendReturn(serial_, signature_, value);
+  }
+}
+
+}  // namespace halvox::platform::linux_

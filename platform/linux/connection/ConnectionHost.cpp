@@ -1,0 +1,199 @@
+#include "platform/linux/connection/ConnectionHost.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <system_error>
+#include <utility>
+#include <variant>
+
+#include <systemd/sd-daemon.h>
+#include <systemd/sd-id128.h>
+
+#include "platform/linux/connection/BusConnection.h"
+#include "platform/linux/connection/BusConnector.h"
+#include "platform/linux/connection/ConnectionLog.h"
+#include "platform/linux/connection/ListeningSocket.h"
+#include "platform/linux/connection/PeerConnection.h"
+#include "platform/linux/connection/SignalWatch.h"
+#include "platform/services.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog{connectionCategory, "ConnectionHost"};
+
+std::string hexOf(const sd_id128_t& id) {
+  std::array<char, SD_ID128_STRING_MAX> text;
+  return sd_id128_to_string(id, text.data());
+}
+
+ServiceIdentity makeIdentity(const std::string& busName) {
+  ServiceIdentity identity{.guidHex = {}, .busName = busName, .machineHex = {}};
+  sd_id128_t id;
+  identity.guidHex = sd_id128_randomize(&id) >= 0 ? hexOf(id) : std::string(32, '0');
+  if (sd_id128_get_machine(&id) >= 0) identity.machineHex = hexOf(id);
+  return identity;
+}
+
+ConnectionOpenError systemFailure(const std::string& what) {
+  return {.kind = ConnectionOpenError::Kind::kSystem,
+          .description = what + ": " + std::generic_category().message(errno)};
+}
+
+}  // namespace
+
+ConnectionHost::ConnectionHost(ConnectionOptions options, Backpressure& backpressure)
+    : options_(std::move(options)),
+      backpressure_(backpressure),
+      identity_(makeIdentity(options_.busName)),
+      inbox_(std::make_shared<Inbox>()),
+      handshakes_(options_.handshakeTimeout),
+      messages_(options_.messageTimeout),
+      acceptRetries_(kAcceptRetryDelay),
+      turn_(options_.beginBatch, options_.endBatch) {
+  if (options_.signals == EndSignals::kHandle) SignalWatch::block();
+  backpressure_.setReliefHandler([inbox = inbox_] { inbox->postRelief(); });
+}
+
+ConnectionHost::~ConnectionHost() { shutDown(); }
+
+std::optional<ConnectionOpenError> ConnectionHost::open() {
+  statistics_ = std::make_shared<ConnectionStatistics>(platform::statistics());
+  dispatcher_ = std::make_unique<RequestDispatcher>(options_, *statistics_, identity_);
+  if (auto error = openLoop()) return error;
+  if (auto error = openSockets()) return error;
+  return openBus();
+}
+
+std::optional<ConnectionOpenError> ConnectionHost::openLoop() {
+  if (!loop_.isOpen() || !inbox_->watchWith(loop_) || !timer_.open(loop_)) {
+    return systemFailure("the event loop");
+  }
+  if (options_.signals == EndSignals::kLeaveAlone) return std::nullopt;
+  signals_ = std::make_unique<SignalWatch>([this] { stopping_ = true; });
+  if (!signals_->start(loop_)) return systemFailure("the signals");
+  return std::nullopt;
+}
+
+std::optional<ConnectionOpenError> ConnectionHost::openSockets() {
+  auto passed = passedSockets();
+  if (auto* error = std::get_if<ConnectionOpenError>(&passed)) return std::move(*error);
+  auto& sockets = std::get<std::vector<UniqueFd>>(passed);
+  if (sockets.empty()) {
+    auto bound = listenOn(options_.socket);
+    if (auto* error = std::get_if<ConnectionOpenError>(&bound)) return std::move(*error);
+    socketFile_ = std::move(std::get<BoundSocket>(bound).file);
+    sockets.push_back(std::move(std::get<BoundSocket>(bound).fd));
+  }
+  for (UniqueFd& fd : sockets) {
+    listeners_.push_back(std::make_unique<ListeningSocket>(std::move(fd), *this));
+    if (!listeners_.back()->start()) return systemFailure("the listening socket");
+  }
+  return std::nullopt;
+}
+
+std::optional<ConnectionOpenError> ConnectionHost::openBus() {
+  if (options_.bus == BusKind::kNone) return std::nullopt;
+  auto connected = BusConnector(options_.busName).connect(options_.bus);
+  if (auto* error = std::get_if<ConnectionOpenError>(&connected)) return std::move(*error);
+  bus_ = std::make_unique<BusConnection>(*this, std::move(std::get<BusSession>(connected)));
+  return std::nullopt;
+}
+
+void ConnectionHost::resume() {
+  if (delegate_ == nullptr || listeners_.empty()) {
+    kLog.error("there is nothing to serve, or nobody to serve it");
+    return;
+  }
+  inbox_->attachToThisThread();
+  if (bus_) bus_->start();
+  static_cast<void>(sd_notify(0, "READY=1"));
+  while (!stopping_) takeTurn();
+  static_cast<void>(sd_notify(0, "STOPPING=1"));
+  shutDown();
+}
+
+void ConnectionHost::takeTurn() {
+  const bool sleeps = maySleep();
+  timer_.arrange(firstDeadline(),
+                 sleeps ? LoopTimer::Before::kSleep : LoopTimer::Before::kNextTurn);
+  turn_.begin();
+  const std::size_t ready =
+      loop_.runOnce(sleeps ? EventLoop::Wait::kBlock : EventLoop::Wait::kPoll);
+  if (sleeps) inbox_->awake();
+  expireDeadlines();
+  turn_.deliver(ready);
+  turn_.finishEnded();
+  turn_.endDeliveries();
+  readMail();
+  turn_.flush();
+  turn_.reap();
+}
+
+bool ConnectionHost::maySleep() { return !turn_.hasWork() && inbox_->trySleep(); }
+
+std::optional<DeadlineQueue::Clock::time_point> ConnectionHost::firstDeadline() const {
+  std::optional<DeadlineQueue::Clock::time_point> first;
+  for (const DeadlineQueue* queue : {&handshakes_, &messages_, &acceptRetries_}) {
+    const auto due = queue->first();
+    if (due.has_value() && (!first.has_value() || *due < *first)) first = due;
+  }
+  return first;
+}
+
+void ConnectionHost::expireDeadlines() {
+  if (!firstDeadline().has_value()) return;
+  const auto now = DeadlineQueue::Clock::now();
+  for (DeadlineQueue* queue : {&handshakes_, &messages_, &acceptRetries_}) queue->expire(now);
+}
+
+void ConnectionHost::readMail() {
+  inbox_->take(mail_);
+  for (const PostedReply& reply : mail_.replies) {
+    reply.ticket->deliver(reply.error.get(), reply.value);
+  }
+  for (const std::shared_ptr<ClientLink>& client : mail_.clientsWithRoom) {
+    if (client->connection() != nullptr) client->connection()->onRoom();
+  }
+  if (mail_.relieved) turn_.relieve();
+  if (mail_.stopAsked) stopping_ = true;
+  mail_.clear();
+}
+
+void ConnectionHost::acceptPeer(UniqueFd fd, const PeerCredentials& credentials) {
+  auto peer =
+      std::make_shared<PeerConnection>(*this, nextClientNumber(), std::move(fd), credentials);
+  peers_.emplace(peer.get(), peer);
+  peer->start();
+  static_cast<void>(admit(peer));
+}
+
+bool ConnectionHost::admit(const std::shared_ptr<ClientConnection>& client) {
+  turn_.beforeDelivery();
+  if (delegate_->listenerShouldAcceptNewConnection(client)) {
+    statistics_->connectionsAccepted.add();
+    return true;
+  }
+  statistics_->connectionsRefused.add();
+  client->abandon();
+  return false;
+}
+
+void ConnectionHost::peerClosed(PeerConnection& peer) {
+  peers_.erase(&peer);
+  for (const auto& listener : listeners_) listener->tryAgain();
+}
+
+// Also after an open() that failed half-way, and more than once.
+void ConnectionHost::shutDown() {
+  inbox_->close();
+  turn_.clear();
+  const auto peers = std::exchange(peers_, {});
+  for (const auto& [key, peer] : peers) peer->abandon();
+  if (bus_) bus_->abandon();
+  listeners_.clear();
+  socketFile_.remove();
+}
+
+}  // namespace halvox::platform::linux_

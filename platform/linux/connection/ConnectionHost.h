@@ -1,0 +1,107 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <unordered_map>
+#include <vector>
+
+#include "platform/connection.h"
+#include "platform/linux/connection/ConnectionStatistics.h"
+#include "platform/linux/connection/Deadlines.h"
+#include "platform/linux/connection/EventLoop.h"
+#include "platform/linux/connection/FrameBuffer.h"
+#include "platform/linux/connection/Inbox.h"
+#include "platform/linux/connection/LinuxConnectionService.h"
+#include "platform/linux/connection/OutputQueue.h"
+#include "platform/linux/connection/RequestDispatcher.h"
+#include "platform/linux/connection/SocketFile.h"
+#include "platform/linux/connection/TurnSchedule.h"
+
+namespace halvox::platform::linux_ {
+
+class BusConnection;
+class ListeningSocket;
+class PeerConnection;
+class SignalWatch;
+struct PeerCredentials;
+
+// What all connections of one service share, and the loop that serves them. One turn of the loop:
+// events (accept, read, deliver), the shares of those that had more, the handlers of connections
+// that ended, the end of the batch, mail of other threads, and one write for each connection that
+// has something to send.
+// Belongs to the thread that calls run(), but for requestStop(); made and opened before it.
+class ConnectionHost final : public NSXPCListener {
+ public:
+  ConnectionHost(ConnectionOptions options, Backpressure& backpressure);
+  ~ConnectionHost() override;
+
+  [[nodiscard]] std::optional<ConnectionOpenError> open();
+  void setDelegate(NSXPCListenerDelegate& delegate) override { delegate_ = &delegate; }
+  void resume() override;
+  void requestStop() { inbox_->postStop(); }
+
+  // What connections work with.
+  [[nodiscard]] const ConnectionOptions& options() const { return options_; }
+  [[nodiscard]] const ServiceIdentity& identity() const { return identity_; }
+  [[nodiscard]] Backpressure& backpressure() { return backpressure_; }
+  [[nodiscard]] EventLoop& loop() { return loop_; }
+  [[nodiscard]] TurnSchedule& turn() { return turn_; }
+  [[nodiscard]] const ReadScratch& scratch() const { return scratch_; }
+  [[nodiscard]] OutputBufferPool& outputBuffers() { return outputBuffers_; }
+  [[nodiscard]] const std::shared_ptr<Inbox>& inbox() const { return inbox_; }
+  [[nodiscard]] RequestDispatcher& dispatcher() { return *dispatcher_; }
+  [[nodiscard]] ConnectionStatistics& statistics() { return *statistics_; }
+  [[nodiscard]] const std::shared_ptr<ConnectionStatistics>& sharedStatistics() const {
+    return statistics_;
+  }
+  [[nodiscard]] DeadlineQueue& handshakes() { return handshakes_; }
+  [[nodiscard]] DeadlineQueue& messages() { return messages_; }
+  [[nodiscard]] DeadlineQueue& acceptRetries() { return acceptRetries_; }
+
+  // A client is there. Both ask the delegate; false when it refused.
+  void acceptPeer(UniqueFd fd, const PeerCredentials& credentials);
+  [[nodiscard]] bool admit(const std::shared_ptr<ClientConnection>& client);
+  // The numbers of clients: 1, 2, ...
+  [[nodiscard]] std::uint64_t nextClientNumber() { return ++lastClientNumber_; }
+  // A peer's descriptor was given back.
+  void peerClosed(PeerConnection& peer);
+
+ private:
+  [[nodiscard]] std::optional<ConnectionOpenError> openLoop();
+  [[nodiscard]] std::optional<ConnectionOpenError> openSockets();
+  [[nodiscard]] std::optional<ConnectionOpenError> openBus();
+  void takeTurn();
+  void expireDeadlines();
+  [[nodiscard]] std::optional<DeadlineQueue::Clock::time_point> firstDeadline() const;
+  [[nodiscard]] bool maySleep();
+  void readMail();
+  void shutDown();
+
+  ConnectionOptions options_;
+  Backpressure& backpressure_;
+  ServiceIdentity identity_;
+  std::shared_ptr<ConnectionStatistics> statistics_;  // shared with the links of clients
+  std::shared_ptr<Inbox> inbox_;                      // shared with the links of clients
+  EventLoop loop_;
+  LoopTimer timer_;
+  DeadlineQueue handshakes_;
+  DeadlineQueue messages_;
+  DeadlineQueue acceptRetries_;
+  ReadScratch scratch_;
+  OutputBufferPool outputBuffers_;
+  std::unique_ptr<RequestDispatcher> dispatcher_;
+  TurnSchedule turn_;
+  Mail mail_;
+  NSXPCListenerDelegate* delegate_ = nullptr;
+  std::unique_ptr<SignalWatch> signals_;
+  SocketFile socketFile_;
+  std::vector<std::unique_ptr<ListeningSocket>> listeners_;
+  std::unordered_map<const PeerConnection*, std::shared_ptr<PeerConnection>> peers_;
+  std::unique_ptr<BusConnection> bus_;
+  std::uint64_t lastClientNumber_ = 0;
+  bool stopping_ = false;
+};
+
+}  // namespace halvox::platform::linux_

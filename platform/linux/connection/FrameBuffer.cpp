@@ -1,0 +1,129 @@
+#include "platform/linux/connection/FrameBuffer.h"
+
+#include <algorithm>
+#include <cstring>
+#include <string>
+#include <utility>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::size_t kBodyLengthOffset = 4;
+
+// The header of a frame that is too large must fit, so that it can be answered.
+constexpr std::size_t kMaxSkippableHeader = kReadBytes - 8;
+
+// The size of a header: its fixed part, the array of fields and the padding to 8 bytes.
+std::size_t headerBytes(std::span<const std::byte> frame) {
+  std::uint32_t fieldBytes = 0;
+  std::memcpy(&fieldBytes, &frame[dbus::kFrameStartBytes - sizeof fieldBytes], sizeof fieldBytes);
+  if (frame[0] == std::byte{'B'}) fieldBytes = __builtin_bswap32(fieldBytes);
+  return (dbus::kFrameStartBytes + fieldBytes + 7) & ~std::size_t{7};
+}
+
+}  // namespace
+
+std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
+  if (const std::size_t missing = missingBytesOfLargeFrame(); missing > 0) {
+    // A header may promise a lot: room is made for as much again as has come, not for all of it.
+    const std::size_t offset = own_.size() - view_.size();
+    const std::size_t grow = std::min(missing, std::max(view_.size(), kReadBytes));
+    own_.erase(own_.begin(), own_.begin() + static_cast<std::ptrdiff_t>(offset));
+    const std::size_t used = own_.size();
+    own_.resize(used + grow);
+    view_ = std::span<const std::byte>(own_).first(used);
+    readSpan_ = std::span<std::byte>(own_).subspan(used);
+    return readSpan_;
+  }
+  const std::span<std::byte> bytes = scratch.bytes();
+  if (!view_.empty()) std::memcpy(bytes.data(), view_.data(), view_.size());
+  view_ = bytes.first(view_.size());
+  inScratch_ = true;
+  readSpan_ = bytes.subspan(view_.size(), kReadBytes);
+  return readSpan_;
+}
+
+void FrameBuffer::received(std::size_t count) {
+  if (!inScratch_) own_.resize(view_.size() + count);
+  const std::byte* start = inScratch_ ? readSpan_.data() - view_.size() : own_.data();
+  view_ = {start, view_.size() + count};
+  const std::size_t dropped = std::min(skip_, view_.size());
+  skip_ -= dropped;
+  view_ = view_.subspan(dropped);
+}
+
+void FrameBuffer::settle() {
+  if (inScratch_) {
+    inScratch_ = false;
+    own_.assign(view_.begin(), view_.end());
+    view_ = own_;
+  }
+  if (!view_.empty()) return;
+  own_ = std::vector<std::byte>();
+  view_ = {};
+}
+
+void FrameBuffer::append(std::span<const std::byte> bytes) {
+  const std::size_t usedUp = own_.size() - view_.size();
+  if (usedUp > own_.size() / 2) {
+    own_.erase(own_.begin(), own_.begin() + static_cast<std::ptrdiff_t>(usedUp));
+  }
+  const std::size_t offset = own_.size() - view_.size();
+  own_.insert(own_.end(), bytes.begin(), bytes.end());
+  view_ = std::span<const std::byte>(own_).subspan(offset);
+}
+
+FrameBuffer::Next FrameBuffer::next() const {
+  Next next;
+  if (view_.empty()) {
+    next.state = skip_ > 0 ? State::kPartial : State::kEmpty;
+    return next;
+  }
+  dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);
+  next.state = State::kPartial;
+  if (measure.state == dbus::FrameMeasure::State::kNeedMoreBytes) return next;
+  if (measure.state == dbus::FrameMeasure::State::kBroken) {
+    next.state = State::kBroken;
+    next.error = std::move(measure.error);
+    return next;
+  }
+  next.totalBytes = measure.totalBytes;
+  if (measure.totalBytes > maxFrameBytes_) {
+    const std::size_t header = headerBytes(view_);
+    if (header > kMaxSkippableHeader) {
+      next.state = State::kBroken;
+      next.error = {"a message of " + std::to_string(measure.totalBytes) + " bytes", 0};
+    } else if (view_.size() >= header) {
+      next.state = State::kOversized;
+      next.bytes = view_.first(header);
+    }
+    return next;
+  }
+  if (view_.size() < measure.totalBytes) return next;
+  next.state = State::kFrame;
+  next.bytes = view_.first(measure.totalBytes);
+  return next;
+}
+
+void FrameBuffer::consume(std::size_t count) {
+  const std::size_t present = std::min(count, view_.size());
+  skip_ += count - present;
+  view_ = view_.subspan(present);
+}
+
+std::vector<std::byte> FrameBuffer::withoutBody(const Next& oversized) {
+  std::vector<std::byte> frame(oversized.bytes.begin(), oversized.bytes.end());
+  std::memset(&frame[kBodyLengthOffset], 0, sizeof(std::uint32_t));
+  return frame;
+}
+
+// More than 0 when the frame that has begun does not fit the scratch and is to be had in full.
+std::size_t FrameBuffer::missingBytesOfLargeFrame() const {
+  if (view_.size() < dbus::kFrameStartBytes) return 0;
+  const dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);
+  if (measure.state != dbus::FrameMeasure::State::kKnown) return 0;
+  if (measure.totalBytes <= kReadBytes || measure.totalBytes > maxFrameBytes_) return 0;
+  return measure.totalBytes > view_.size() ? measure.totalBytes - view_.size() : 0;
+}
+
+}  // namespace halvox::platform::linux_

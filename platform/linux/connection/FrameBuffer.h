@@ -1,0 +1,81 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <span>
+#include <vector>
+
+#include "platform/linux/connection/ConnectionLimits.h"
+#include "platform/linux/connection/wire/Frame.h"
+
+namespace halvox::platform::linux_ {
+
+// Where all connections of a thread read into, one after the other: room for the rest of the last
+// read and for a new one.
+class ReadScratch {
+ public:
+  ReadScratch() : bytes_(std::make_unique_for_overwrite<std::byte[]>(kBytes)) {}
+  [[nodiscard]] std::span<std::byte> bytes() const { return {bytes_.get(), kBytes}; }
+
+ private:
+  static constexpr std::size_t kBytes = 2 * kReadBytes;
+  std::unique_ptr<std::byte[]> bytes_;
+};
+
+// What one connection has received and not yet used up, cut into frames.
+// Frames are read where they arrive, in the shared scratch; only what is left over at the end of a
+// connection's share is copied to storage of its own. An idle connection holds no storage; a frame
+// larger than a read gets storage that grows with what has really arrived. Belongs to one thread.
+class FrameBuffer {
+ public:
+  enum class State : std::uint8_t {
+    kEmpty,
+    kPartial,    // a frame has begun
+    kFrame,      // `bytes` is one whole frame of `totalBytes`
+    kOversized,  // a frame that is too large: `bytes` is its header alone
+    kBroken,     // no frame: `error` says why
+  };
+  struct Next {
+    State state = State::kEmpty;
+    std::size_t totalBytes = 0;
+    std::span<const std::byte> bytes;
+    dbus::WireError error;
+  };
+
+  explicit FrameBuffer(std::size_t maxFrameBytes) : maxFrameBytes_(maxFrameBytes) {}
+  FrameBuffer(const FrameBuffer&) = delete;
+  FrameBuffer& operator=(const FrameBuffer&) = delete;
+
+  // Where the next read goes; tell received() how much came, also when nothing did. Until settle()
+  // nobody else may use the scratch.
+  [[nodiscard]] std::span<std::byte> readInto(const ReadScratch& scratch);
+  void received(std::size_t count);
+  // Moves what is left out of the scratch, and gives storage back that is not needed any more.
+  void settle();
+
+  // Adds bytes from elsewhere. Not between readInto() and settle().
+  void append(std::span<const std::byte> bytes);
+
+  // All that is there, whatever it is.
+  [[nodiscard]] std::span<const std::byte> unused() const { return view_; }
+  // What comes next. Points into this buffer: valid until it is changed.
+  [[nodiscard]] Next next() const;
+  // Uses up bytes; those that have not arrived yet are dropped when they do.
+  void consume(std::size_t count);
+
+  // The header of a kOversized frame as a frame of its own, one without a body.
+  [[nodiscard]] static std::vector<std::byte> withoutBody(const Next& oversized);
+
+ private:
+  [[nodiscard]] std::size_t missingBytesOfLargeFrame() const;
+
+  std::size_t maxFrameBytes_;
+  std::vector<std::byte> own_;
+  std::span<const std::byte> view_;  // what is unused, in own_ or in the scratch
+  std::span<std::byte> readSpan_;    // what readInto() gave
+  std::size_t skip_ = 0;             // bytes to drop as they arrive
+  bool inScratch_ = false;
+};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,28 @@
+#include "platform/linux/connection/LinuxConnectionService.h"
+
+#include <utility>
+
+#include "platform/linux/connection/ConnectionHost.h"
+#include "platform/linux/connection/CurrentDelivery.h"
+
+namespace halvox::platform::linux_ {
+
+LinuxConnectionService::LinuxConnectionService(ConnectionOptions options,
+                                               Backpressure& backpressure)
+    : host_(std::make_unique<ConnectionHost>(std::move(options), backpressure)) {}
+
+LinuxConnectionService::~LinuxConnectionService() = default;
+
+std::optional<ConnectionOpenError> LinuxConnectionService::open() { return host_->open(); }
+
+NSXPCListener& LinuxConnectionService::serviceListener() { return *host_; }
+
+const NSXPCConnection* LinuxConnectionService::currentConnection() const {
+  return CurrentDelivery::connection();
+}
+
+RequestToken LinuxConnectionService::currentRequest() const { return CurrentDelivery::request(); }
+
+void LinuxConnectionService::requestStop() { host_->requestStop(); }
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,92 @@
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <cstdint>
+#include <filesystem>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/connection.h"
+#include "platform/linux/connection/ConnectionLimits.h"
+#include "platform/linux/runtime/Backpressure.h"
+#include "platform/linux/runtime/Configuration.h"
+
+namespace halvox::platform::linux_ {
+
+class ConnectionHost;
+class ListeningSocket;
+
+// Whether SIGTERM and SIGINT end the listener's resume().
+enum class EndSignals : std::uint8_t { kHandle, kLeaveAlone };
+
+// How connections are served.
+struct ConnectionOptions {
+  std::filesystem::path socket;  // not used when the service is started through a socket
+  BusKind bus = BusKind::kNone;
+  std::string busName = "com.tarno.halvox.reporting";
+  std::chrono::milliseconds handshakeTimeout{30'000};
+  std::chrono::milliseconds messageTimeout{60'000};
+  std::uint64_t clientHistoryMegabytes = 256;  // 2^20 bytes each
+  std::uint64_t clientSessions = 100'000;
+  std::size_t maxFrameBytes = 32 * kMiB;
+  EndSignals signals = EndSignals::kHandle;
+  // Called on the I/O thread before the first delivery of a turn and after the last one. A reply
+  // that is given on this thread during `endBatch` is written in the same turn.
+  std::function<void()> beginBatch;
+  std::function<void()> endBatch;
+};
+
+// Why nothing can be served.
+struct ConnectionOpenError {
+  enum class Kind : std::uint8_t {
+    kPathTooLong,
+    kDirectoryMissing,
+    kDirectoryNotWritable,
+    kAlreadyServed,  // somebody answers on that socket
+    kNotASocket,     // a file of another kind is in the way
+    kBadActivation,  // a descriptor that was passed is no listening stream socket
+    kBusUnreachable,
+    kBusNameTaken,
+    kSystem,  // anything else that the system refused
+  };
+  Kind kind = Kind::kSystem;
+  std::string description;  // one line for the user, naming the object and the system's error
+};
+
+// Connections over D-Bus: peer to peer on a Unix socket of its own, and on a bus when asked to.
+//
+// One thread, the one that calls resume() of the listener, carries out all input and output, runs
+// the delegate, the handlers and the requests. It never waits for a client: what a client does not
+// read is bounded and only its own requests wait for it. An idle service makes no wake-ups.
+//
+// When the bus is lost, its senders are invalidated and the socket is served on.
+// At the end the handlers of connections that are still there are not called.
+class LinuxConnectionService final : public ConnectionService {
+ public:
+  // Make it before the first thread starts: it takes the end signals from all threads to come, and
+  // the relief of `backpressure`, which must outlive it. Platform services must be installed when
+  // open() is called.
+  LinuxConnectionService(ConnectionOptions options, Backpressure& backpressure);
+  LinuxConnectionService(const LinuxConnectionService&) = delete;
+  LinuxConnectionService& operator=(const LinuxConnectionService&) = delete;
+  ~LinuxConnectionService() override;
+
+  // Makes the socket, or takes the ones passed at start, and connects to the bus. A socket file
+  // that nobody serves any more is replaced. May wait for the bus, a few seconds at most.
+  [[nodiscard]] std::optional<ConnectionOpenError> open();
+
+  NSXPCListener& serviceListener() override;
+  [[nodiscard]] const NSXPCConnection* currentConnection() const override;
+  [[nodiscard]] RequestToken currentRequest() const override;
+
+  // Lets resume() return at the end of its turn. Any thread.
+  void requestStop();
+
+ private:
+  std::unique_ptr<ConnectionHost> host_;
+};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,74 @@
+#include "platform/linux/connection/ListeningSocket.h"
+
+#include <cerrno>
+#include <optional>
+#include <string>
+#include <system_error>
+#include <utility>
+
+#include <sys/epoll.h>
+#include <sys/socket.h>
+
+#include "platform/linux/connection/ConnectionHost.h"
+#include "platform/linux/connection/ConnectionLimits.h"
+#include "platform/linux/connection/ConnectionLog.h"
+#include "platform/linux/connection/PeerConnection.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog{connectionCategory, "ListeningSocket"};
+
+std::optional<PeerCredentials> credentialsOf(int fd) {
+  ucred credentials{};
+  socklen_t size = sizeof credentials;
+  if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &credentials, &size) != 0) return std::nullopt;
+  return PeerCredentials{.pid = credentials.pid, .uid = credentials.uid};
+}
+
+}  // namespace
+
+ListeningSocket::ListeningSocket(UniqueFd fd, ConnectionHost& host)
+    : fd_(std::move(fd)), host_(host), retry_(*this) {}
+
+bool ListeningSocket::start() { return host_.loop().watch(fd_.get(), EPOLLIN, *this); }
+
+void ListeningSocket::tryAgain() {
+  if (!std::exchange(isWaiting_, false)) return;
+  retry_.stop();
+  static_cast<void>(start());
+}
+
+void ListeningSocket::onReady(std::uint32_t /*events*/) {
+  for (int count = 0; count < kAcceptsPerTurn; ++count) {
+    if (!acceptOne()) return;
+  }
+}
+
+bool ListeningSocket::acceptOne() {
+  UniqueFd fd(accept4(fd_.get(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
+  if (fd) {
+    isShort_ = false;
+    if (const std::optional<PeerCredentials> credentials = credentialsOf(fd.get())) {
+      host_.acceptPeer(std::move(fd), *credentials);
+    }
+    return true;
+  }
+  const int error = errno;
+  const bool noDescriptors =
+      error == EMFILE || error == ENFILE || error == ENOBUFS || error == ENOMEM;
+  if (noDescriptors) waitForDescriptors(error);
+  // Anything but an empty backlog concerns one connection, and the next one may be well.
+  return !noDescriptors && error != EAGAIN && error != EINVAL && error != EBADF;
+}
+
+void ListeningSocket::waitForDescriptors(int error) {
+  host_.loop().forget(fd_.get());
+  isWaiting_ = true;
+  host_.acceptRetries().start(retry_);
+  if (std::exchange(isShort_, true)) return;
+  host_.statistics().acceptPauses.add();
+  kLog.error("new connections have to wait: ", std::generic_category().message(error));
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,102 @@
+#include "platform/linux/connection/PeerConnection.h"
+
+#include <utility>
+
+#include "platform/linux/connection/ConnectionHost.h"
+#include "platform/linux/connection/ConnectionLog.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog{connectionCategory, "PeerConnection"};
+
+}  // namespace
+
+PeerConnection::PeerConnection(ConnectionHost& host, std::uint64_t number, UniqueFd fd,
+                               const PeerCredentials& credentials)
+    : ClientConnection(host, number, credentials.pid),
+      uid_(credentials.uid),
+      stream_(std::move(fd), host, *this),
+      handshake_(std::make_unique<dbus::ServerHandshake>(host.identity().guidHex, credentials.uid)),
+      deadline_(*this) {}
+
+void PeerConnection::start() {
+  stream_.setReading(true);
+  host().handshakes().start(deadline_);
+}
+
+std::string PeerConnection::description() const {
+  return "client " + std::to_string(number()) + " (pid " + std::to_string(processIdentifier()) +
+         ", uid " + std::to_string(uid_) + ")";
+}
+
+void PeerConnection::setReading(bool reading) {
+  if (!reading) deadline_.stop();
+  stream_.setReading(reading || handshake_ != nullptr);
+}
+
+void PeerConnection::onReadable() {
+  // Whole messages that wait for the next turn come before what is still in the socket.
+  if (handshake_ == nullptr && !wantsInput()) return;
+  if (stream_.read() == SocketStream::Read::kEnded) {
+    peerClosed_ = true;
+    stream_.setReading(false);
+  }
+  if (handshake_ != nullptr && !continueHandshake()) {
+    stream_.input().settle();
+    if (peerClosed_) end(Why::kPeerVanished);
+    return;
+  }
+  deliver();
+}
+
+bool PeerConnection::continueHandshake() {
+  const dbus::HandshakeProgress progress =
+      handshake_->feed(stream_.input().unused(), stream_.output().bytes());
+  stream_.outputAdded();
+  stream_.input().consume(progress.consumedBytes);
+  switch (progress.state) {
+    case dbus::HandshakeState::kContinue:
+      return false;
+    case dbus::HandshakeState::kDone:
+      handshake_.reset();
+      deadline_.stop();
+      return true;
+    case dbus::HandshakeState::kFailed:
+      kLog.notice("closing ", description(), ": the handshake failed: ", progress.error);
+      end(Why::kClosedHere);
+      return false;
+  }
+  return false;
+}
+
+void PeerConnection::onDelivered(bool begun, bool progress) {
+  if (peerClosed_) {
+    if (begun) kLog.info("in the middle of a message went away ", description());
+    return end(Why::kPeerVanished);
+  }
+  stream_.setReading(true);
+  if (handshake_ != nullptr) return;
+  if (progress || !begun) deadline_.stop();
+  if (begun) host().messages().start(deadline_);
+}
+
+void PeerConnection::onDeadline() {
+  const bool inHandshake = handshake_ != nullptr;
+  const auto waited = inHandshake ? host().handshakes().delay() : host().messages().delay();
+  kLog.notice("closing ", description(), ": waited ", waited.count(), " ms for the end of ",
+              inHandshake ? "its handshake" : "a message that it has begun");
+  host().statistics().connectionsTimedOut.add();
+  end(Why::kClosedHere);
+}
+
+void PeerConnection::onEnded() {
+  deadline_.stop();
+  stream_.setReading(false);
+}
+
+void PeerConnection::onFinished() {
+  if (stream_.close()) host().peerClosed(*this);
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,197 @@
+#include "platform/linux/connection/RequestDispatcher.h"
+
+#include <string>
+#include <string_view>
+#include <utility>
+
+#include "platform/linux/connection/ClientConnection.h"
+#include "platform/linux/connection/CurrentDelivery.h"
+#include "platform/linux/connection/ErrorNames.h"
+#include "platform/linux/connection/LinuxConnectionService.h"
+#include "platform/linux/connection/wire/ValueDecoder.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// Names from the wire are valid, but a path can be as long as the message.
+std::string quoted(std::string_view name) {
+  constexpr std::size_t kMaxShown = 255;
+  std::string text = "\"";
+  text += name.substr(0, kMaxShown);
+  if (name.size() > kMaxShown) text += "...";
+  return text += '"';
+}
+
+const InterfaceMethod* findMethod(const NSXPCInterface& interface, std::string_view name) {
+  for (const InterfaceMethod& method : interface.methods) {
+    if (method.name == name) return &method;
+  }
+  return nullptr;
+}
+
+std::size_t weightOf(const InterfaceMethod& method) {
+  const bool answersList = method.out.starts_with('a') && !method.out.starts_with("a{");
+  return answersList ? kListRequestWeight : 1;
+}
+
+ReplyCallback makeReply(const ClientConnection& client, const dbus::MessageHeader& header,
+                        const InterfaceMethod& method) {
+  if ((header.flags & dbus::kNoReplyExpected) != 0) {
+    return [](const std::optional<Error>&, const Value&) {};
+  }
+  return [ticket = std::make_shared<ReplyTicket>(client.link(), header.serial, method.out)](
+             const std::optional<Error>& error, const Value& value) {
+    ReplyTicket::answer(ticket, error, value);
+  };
+}
+
+}  // namespace
+
+struct RequestDispatcher::Request {
+  ClientConnection& client;
+  const dbus::Frame& frame;
+  std::size_t frameBytes;
+
+  [[nodiscard]] const dbus::MessageHeader& header() const { return frame.header; }
+  // True when the request is for the object that the client's connection exports.
+  [[nodiscard]] bool isForExportedObject() const {
+    const NSXPCInterface* exported = client.exportedInterface();
+    return exported != nullptr && client.exportedObject() != nullptr &&
+           header().path == exported->objectPath;
+  }
+};
+
+RequestDispatcher::RequestDispatcher(const ConnectionOptions& options,
+                                     ConnectionStatistics& statistics,
+                                     const ServiceIdentity& identity)
+    : options_(options), statistics_(statistics), standard_(identity) {}
+
+void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& frame,
+                                 std::size_t frameBytes) {
+  const dbus::MessageHeader& header = frame.header;
+  if (header.type != dbus::MessageType::kMethodCall) {
+    statistics_.messagesIgnored.add();
+    return;
+  }
+  statistics_.requestsReceived.add();
+  const Request request{.client = client, .frame = frame, .frameBytes = frameBytes};
+  if (request.isForExportedObject()) {
+    const NSXPCInterface& exported = *client.exportedInterface();
+    if (header.interface.empty() || header.interface == exported.name) {
+      const InterfaceMethod* method = findMethod(exported, header.member);
+      if (method != nullptr) return deliver(request, *method);
+    }
+  }
+  if (const StandardMethod* method = standard_.find(client, header); method != nullptr) {
+    return answerStandard(request, *method);
+  }
+  refuseUnknown(request);
+}
+
+void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& method) {
+  if (method.effect != MethodEffect::kHoldsNoMore && isOverLimits(request, method)) return;
+  if (!decode(request, method.in)) return;
+  statistics_.requestsDelivered.add();
+  ClientConnection& client = request.client;
+  const FlowControl::Cost cost{.requests = weightOf(method), .bytes = request.frameBytes};
+  const RequestToken token = std::make_shared<OpenRequest>(client.link(), cost);
+  ReplyCallback reply = makeReply(client, request.header(), method);
+  {
+    const CurrentDelivery current(client, &token);
+    method.invoke(*client.exportedObject(),
+                  Invocation{.arguments = arguments_, .reply = std::move(reply)});
+  }
+  arguments_.clear();
+}
+
+// Requests that were read and are not carried out yet are not in the sums, so a client can pass a
+// bound by what those make it hold.
+bool RequestDispatcher::isOverLimits(const Request& request, const InterfaceMethod& method) {
+  const ResourceUse use = request.client.exportedObject()->resourceUse();
+  const std::uint64_t maxBytes = options_.clientHistoryMegabytes * kMiB;
+  if (use.bytes >= maxBytes) {
+    request.client.refuse(
+        request.header(), Refusal::kHistoryLimit, error_names::kLimitsExceeded,
+        "client_history_megabytes = " + std::to_string(options_.clientHistoryMegabytes) +
+            " is reached: the client's sessions hold " + std::to_string(use.bytes) + " bytes");
+    return true;
+  }
+  if (method.effect == MethodEffect::kMakesSession && use.sessions >= options_.clientSessions) {
+    request.client.refuse(request.header(), Refusal::kSessionLimit, error_names::kLimitsExceeded,
+                          "client_sessions = " + std::to_string(options_.clientSessions) +
+                              " is reached: the client has " + std::to_string(use.sessions) +
+                              " sessions");
+    return true;
+  }
+  return false;
+}
+
+void RequestDispatcher::answerStandard(const Request& request, const StandardMethod& method) {
+  if (!decode(request, method.in)) return;
+  statistics_.requestsAnsweredHere.add();
+  const dbus::MessageHeader& header = request.header();
+  const StandardAnswer answer = method.answer({.client = request.client,
+                                               .path = header.path,
+                                               .arguments = arguments_,
+                                               .identity = standard_.identity()});
+  arguments_.clear();
+  if ((header.flags & dbus::kNoReplyExpected) != 0) return;
+  statistics_.repliesGiven.add();
+  if (answer.errorName.empty()) {
+    request.client.sendReturn(header.serial, method.out, answer.value);
+  } else {
+    request.client.sendError(header.serial, answer.errorName, answer.errorText);
+  }
+}
+
+// False when the request was refused or the client closed.
+bool RequestDispatcher::decode(const Request& request, std::string_view signature) {
+  const dbus::MessageHeader& header = request.header();
+  if (header.unixFds != 0) {
+    request.client.refuse(
+        header, Refusal::kUnsupportedValue, error_names::kInvalidArgs,
+        "file descriptors (signature \"h\") are not taken by " + quoted(header.member));
+    return false;
+  }
+  const std::optional<dbus::DecodeError> error =
+      dbus::decodeBody(request.frame, signature, arguments_);
+  if (!error.has_value()) return true;
+  switch (error->kind) {
+    case dbus::DecodeError::Kind::kMalformed:
+      request.client.onMalformed(error->message);
+      break;
+    case dbus::DecodeError::Kind::kUnsupported:
+      request.client.refuse(header, Refusal::kUnsupportedValue, error_names::kInvalidArgs,
+                            quoted(header.member) + ": " + error->message);
+      break;
+    case dbus::DecodeError::Kind::kWrongSignature:
+      request.client.refuse(header, Refusal::kWrongSignature, error_names::kInvalidArgs,
+                            quoted(header.member) + ": " + error->message);
+      break;
+  }
+  return false;
+}
+
+void RequestDispatcher::refuseUnknown(const Request& request) {
+  const dbus::MessageHeader& header = request.header();
+  switch (standard_.unknownPartOf(request.client, header)) {
+    case UnknownPart::kObject:
+      request.client.refuse(header, Refusal::kUnknownObject, error_names::kUnknownObject,
+                            "there is no object at path " + quoted(header.path));
+      break;
+    case UnknownPart::kInterface:
+      request.client.refuse(header, Refusal::kUnknownInterface, error_names::kUnknownInterface,
+                            "the object at path " + quoted(header.path) + " has no interface " +
+                                quoted(header.interface));
+      break;
+    case UnknownPart::kMethod:
+      request.client.refuse(
+          header, Refusal::kUnknownMethod, error_names::kUnknownMethod,
+          (header.interface.empty() ? "the object at path " + quoted(header.path)
+                                    : "the interface " + quoted(header.interface)) +
+              " has no method " + quoted(header.member));
+      break;
+  }
+}
+
+}  // namespace halvox::platform::linux_

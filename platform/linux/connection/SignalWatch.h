@@ -1,0 +1,27 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+
+#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/connection/EventLoop.h"
+
+namespace halvox::platform::linux_ {
+
+// Hears SIGTERM and SIGINT as events of a loop. Belongs to the loop's thread.
+class SignalWatch final : public EventSource {
+ public:
+  // Keeps the two signals away from this thread and from those that it starts from now on.
+  static void block();
+
+  explicit SignalWatch(std::function<void()> onSignal);
+  // False when the system gave no descriptor for it.
+  [[nodiscard]] bool start(EventLoop& loop);
+  void onReady(std::uint32_t events) override;
+
+ private:
+  std::function<void()> onSignal_;
+  UniqueFd fd_;
+};
+
+}  // namespace halvox::platform::linux_

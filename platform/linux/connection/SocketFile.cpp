@@ -1,0 +1,154 @@
+#include "platform/linux/connection/SocketFile.h"
+
+#include <cerrno>
+#include <cstring>
+#include <string>
+#include <system_error>
+#include <utility>
+
+#include <fcntl.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <systemd/sd-daemon.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using Kind = ConnectionOpenError::Kind;
+
+constexpr mode_t kAnybodyMayConnect = 0666;
+
+std::string systemError(int error) { return std::generic_category().message(error); }
+
+ConnectionOpenError failure(Kind kind, const std::filesystem::path& path, const std::string& why) {
+  return {.kind = kind, .description = "socket " + path.string() + ": " + why};
+}
+
+UniqueFd newSocket() {
+  return UniqueFd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
+}
+
+std::optional<sockaddr_un> addressOf(const std::filesystem::path& path) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  const std::string& text = path.native();
+  if (text.empty() || text.size() >= sizeof address.sun_path) return std::nullopt;
+  std::memcpy(address.sun_path, text.data(), text.size());
+  return address;
+}
+
+// What stands at the path: nothing, a socket without anybody behind it, or something in the way.
+std::optional<ConnectionOpenError> clearTheWay(const std::filesystem::path& path,
+                                               const sockaddr_un& address) {
+  struct stat status {};
+  if (lstat(path.c_str(), &status) != 0) return std::nullopt;  // bind() will say what is wrong
+  if (!S_ISSOCK(status.st_mode)) {
+    return failure(Kind::kNotASocket, path, "a file that is no socket is in its place");
+  }
+  const UniqueFd probe = newSocket();
+  if (!probe) return failure(Kind::kSystem, path, systemError(errno));
+  const int result =
+      connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
+  if (result == 0 || errno == EAGAIN || errno == EINPROGRESS) {
+    return failure(Kind::kAlreadyServed, path, "another service answers on it");
+  }
+  if (errno != ECONNREFUSED) {
+    return failure(Kind::kSystem, path, "cannot tell who serves it: " + systemError(errno));
+  }
+  static_cast<void>(unlink(path.c_str()));
+  return std::nullopt;
+}
+
+ConnectionOpenError bindFailure(const std::filesystem::path& path, int error) {
+  switch (error) {
+    case ENOENT:
+    case ENOTDIR:
+      return failure(Kind::kDirectoryMissing, path, "its directory does not exist");
+    case EACCES:
+    case EROFS:
+    case EPERM:
+      return failure(Kind::kDirectoryNotWritable, path,
+                     "its directory cannot be written: " + systemError(error));
+    case EADDRINUSE:
+      return failure(Kind::kAlreadyServed, path, "another service has just taken it");
+    default:
+      return failure(Kind::kSystem, path, systemError(error));
+  }
+}
+
+}  // namespace
+
+SocketFile::SocketFile(std::filesystem::path path) : path_(std::move(path)) {
+  struct stat status {};
+  if (lstat(path_.c_str(), &status) != 0) {
+    path_.clear();
+    return;
+  }
+  device_ = status.st_dev;
+  inode_ = status.st_ino;
+}
+
+SocketFile::SocketFile(SocketFile&& other) noexcept
+    : path_(std::exchange(other.path_, {})), device_(other.device_), inode_(other.inode_) {}
+
+SocketFile& SocketFile::operator=(SocketFile&& other) noexcept {
+  remove();
+  path_ = std::exchange(other.path_, {});
+  device_ = other.device_;
+  inode_ = other.inode_;
+  return *this;
+}
+
+void SocketFile::remove() noexcept {
+  struct stat status {};
+  if (!path_.empty() && lstat(path_.c_str(), &status) == 0 && status.st_dev == device_ &&
+      status.st_ino == inode_) {
+    static_cast<void>(unlink(path_.c_str()));
+  }
+  path_.clear();
+}
+
+std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path) {
+  const std::optional<sockaddr_un> address = addressOf(path);
+  if (!address.has_value()) {
+    return failure(Kind::kPathTooLong, path,
+                   "the path must have 1 to " + std::to_string(sizeof(sockaddr_un::sun_path) - 1) +
+                       " bytes, not " + std::to_string(path.native().size()));
+  }
+  if (std::optional<ConnectionOpenError> error = clearTheWay(path, *address)) {
+    return *std::move(error);
+  }
+  BoundSocket bound{.fd = newSocket(), .file = {}};
+  if (!bound.fd) return failure(Kind::kSystem, path, systemError(errno));
+  const auto* generic = reinterpret_cast<const sockaddr*>(&*address);
+  if (bind(bound.fd.get(), generic, sizeof *address) != 0) return bindFailure(path, errno);
+  bound.file = SocketFile(path);
+  if (chmod(path.c_str(), kAnybodyMayConnect) != 0 || listen(bound.fd.get(), SOMAXCONN) != 0) {
+    return failure(Kind::kSystem, path, systemError(errno));
+  }
+  return bound;
+}
+
+std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
+  std::vector<UniqueFd> sockets;
+  const int count = sd_listen_fds(1);
+  for (int fd = SD_LISTEN_FDS_START; fd < SD_LISTEN_FDS_START + count; ++fd) {
+    sockets.emplace_back(fd);
+    constexpr int kListening = 1;
+    if (sd_is_socket_unix(fd, SOCK_STREAM, kListening, nullptr, 0) <= 0) {
+      return ConnectionOpenError{.kind = Kind::kBadActivation,
+                                 .description = "the passed descriptor " + std::to_string(fd) +
+                                                " is no listening Unix stream socket"};
+    }
+    static_cast<void>(fcntl(fd, F_SETFL, O_NONBLOCK));
+  }
+  if (count < 0) {
+    return ConnectionOpenError{
+        .kind = Kind::kBadActivation,
+        .description = "the passed descriptors cannot be used: " + systemError(-count)};
+  }
+  return sockets;
+}
+
+}  // namespace halvox::platform::linux_

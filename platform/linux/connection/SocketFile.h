@@ -1,0 +1,48 @@
+#pragma once
+
+#include <filesystem>
+#include <optional>
+#include <variant>
+#include <vector>
+
+#include <sys/types.h>
+
+#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/connection/LinuxConnectionService.h"
+
+namespace halvox::platform::linux_ {
+
+// The file of a socket that we made. Removed with this object, unless somebody else's file is there
+// by then. Move-only.
+class SocketFile {
+ public:
+  SocketFile() = default;
+  // Remembers the file that is at `path` now.
+  explicit SocketFile(std::filesystem::path path);
+  SocketFile(SocketFile&& other) noexcept;
+  SocketFile& operator=(SocketFile&& other) noexcept;
+  ~SocketFile() { remove(); }
+
+  void remove() noexcept;
+
+ private:
+  std::filesystem::path path_;  // empty when there is nothing to remove
+  dev_t device_ = 0;
+  ino_t inode_ = 0;
+};
+
+// A socket that listens on a file.
+struct BoundSocket {
+  UniqueFd fd;
+  SocketFile file;
+};
+
+// Makes the socket at `path`, which any process may connect to. A socket file that nobody serves
+// any more is replaced; any other file is left alone. Blocks for no longer than a connect does.
+std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path);
+
+// The sockets that the service was started through; none when it was started otherwise. Later
+// calls give none, and child processes do not inherit them.
+std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets();
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,83 @@
+#pragma once
+
+#include <cstdint>
+#include <span>
+#include <string>
+#include <string_view>
+
+#include "platform/linux/connection/wire/Frame.h"
+#include "platform/value.h"
+
+namespace halvox::platform::linux_ {
+
+class ClientConnection;
+
+// Who the service is, as clients of D-Bus ask for it.
+struct ServiceIdentity {
+  std::string guidHex;     // 32 hexadecimal digits, anew at each start
+  std::string busName;     // the well-known name
+  std::string machineHex;  // 32 hexadecimal digits; empty when the system has none
+};
+
+// The answer of a standard method: a value, or an error when `errorName` is not empty.
+struct StandardAnswer {
+  Value value{};
+  std::string_view errorName{};
+  std::string errorText{};
+};
+
+// One call of a standard method; nothing of it outlives the call.
+struct StandardRequest {
+  ClientConnection& client;
+  std::string_view path;
+  std::span<const Value> arguments;
+  const ServiceIdentity& identity;
+};
+
+// Which objects have a standard method.
+enum class StandardScope : std::uint8_t {
+  kEverywhere,     // any path at all
+  kTree,           // the exported object and its parents
+  kObject,         // the exported object
+  kStandInForBus,  // any path, for clients that have no bus between
+};
+
+struct StandardMethod {
+  std::string_view interface;
+  std::string_view name;
+  std::string_view in;
+  std::string_view out;
+  StandardScope scope = StandardScope::kEverywhere;
+  StandardAnswer (*answer)(const StandardRequest& request) = nullptr;
+};
+
+// The methods of one standard interface.
+std::span<const StandardMethod> objectMethods();  // Peer, Introspectable and Properties
+std::span<const StandardMethod> busMethods();     // what a bus client asks its bus for
+
+// Which part of a request names something that does not exist.
+enum class UnknownPart : std::uint8_t { kObject, kInterface, kMethod };
+
+// The interfaces of D-Bus itself, which the adapter answers on behalf of the exported object, and,
+// for clients without a bus between, the little of the bus that they need to work unchanged.
+// Belongs to the I/O thread. Does not own the identity.
+class StandardInterfaces {
+ public:
+  explicit StandardInterfaces(const ServiceIdentity& identity) : identity_(identity) {}
+
+  // The standard method that a request asks for, or null.
+  [[nodiscard]] const StandardMethod* find(const ClientConnection& client,
+                                           const dbus::MessageHeader& request) const;
+  // Why find() and the exported object have nothing for the request.
+  [[nodiscard]] UnknownPart unknownPartOf(const ClientConnection& client,
+                                          const dbus::MessageHeader& request) const;
+  [[nodiscard]] const ServiceIdentity& identity() const { return identity_; }
+
+ private:
+  const ServiceIdentity& identity_;
+};
+
+// True when `path` is a parent of `objectPath`, the root included.
+bool isParentPath(std::string_view path, std::string_view objectPath);
+
+}  // namespace halvox::platform::linux_

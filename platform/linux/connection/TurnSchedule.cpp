@@ -1,0 +1,84 @@
+#include "platform/linux/connection/TurnSchedule.h"
+
+#include <utility>
+
+#include "platform/linux/connection/ClientConnection.h"
+#include "platform/linux/connection/ConnectionLimits.h"
+#include "platform/linux/connection/SocketStream.h"
+
+namespace halvox::platform::linux_ {
+
+TurnSchedule::TurnSchedule(std::function<void()> beginBatch, std::function<void()> endBatch)
+    : beginBatch_(std::move(beginBatch)),
+      endBatch_(std::move(endBatch)),
+      requestsPerClient_(kTurnRequests) {}
+
+void TurnSchedule::deliverNext(std::shared_ptr<ClientConnection> client) {
+  next_.push_back(std::move(client));
+}
+
+void TurnSchedule::deliverWhenRelieved(std::shared_ptr<ClientConnection> client) {
+  waitingForRelief_.push_back(std::move(client));
+}
+
+void TurnSchedule::flushLater(SocketStream& stream) { flushing_.push_back(&stream); }
+
+void TurnSchedule::finishNext(std::shared_ptr<ClientConnection> client) {
+  ending_.push_back(std::move(client));
+}
+
+void TurnSchedule::beforeDelivery() {
+  if (inBatch_) return;
+  inBatch_ = true;
+  if (beginBatch_) beginBatch_();
+}
+
+bool TurnSchedule::hasWork() const {
+  return !next_.empty() || !ending_.empty() || !flushing_.empty();
+}
+
+void TurnSchedule::begin() {
+  std::swap(due_, next_);
+  std::swap(ended_, ending_);
+}
+
+void TurnSchedule::deliver(std::size_t readyCount) {
+  requestsPerClient_ = readyCount + due_.size() <= kFewClients ? kTurnRequests : kShortTurnRequests;
+  for (const std::shared_ptr<ClientConnection>& client : due_) client->deliver();
+  due_.clear();
+}
+
+void TurnSchedule::finishEnded() {
+  for (std::shared_ptr<ClientConnection>& client : ended_) {
+    beforeDelivery();
+    client->finish();
+    finished_.push_back(std::move(client));
+  }
+  ended_.clear();
+}
+
+void TurnSchedule::endDeliveries() {
+  if (!std::exchange(inBatch_, false)) return;
+  if (endBatch_) endBatch_();
+}
+
+void TurnSchedule::relieve() {
+  Clients relieved;
+  std::swap(relieved, waitingForRelief_);
+  for (const std::shared_ptr<ClientConnection>& client : relieved) client->onRelief();
+}
+
+void TurnSchedule::flush() {
+  // A flush can make its owner deliver or end in the next turn, but adds no other flush.
+  for (SocketStream* stream : flushing_) stream->flush();
+  flushing_.clear();
+}
+
+void TurnSchedule::clear() {
+  for (Clients* clients : {&due_, &next_, &waitingForRelief_, &ending_, &ended_, &finished_}) {
+    std::exchange(*clients, {});
+  }
+  flushing_.clear();
+}
+
+}  // namespace halvox::platform::linux_
