@@ -73,6 +73,7 @@ bool HVReportingSession::createMessageIdentifierWithCategory(const HistoryLock& 
                                                              const Dictionary& message) {
   if (!history->has_value()) return false;
   MessageHistory& messages = **history;
+  const std::size_t before = messages.memorySize();
   MessageHistory::Base& base = messages.base(category, type);
   const Dictionary* previous = messages.newestMessage(base);
   if (previous != nullptr && !isExemptFromSuppression(category, type) &&
@@ -80,7 +81,6 @@ bool HVReportingSession::createMessageIdentifierWithCategory(const HistoryLock& 
     kSessionLog.debug("dropping redundant event");
     return true;
   }
-  const std::size_t before = messages.memorySize();
   messages.append(base, message);
   charge(before, messages.memorySize());
   return false;

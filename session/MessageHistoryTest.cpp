@@ -1,0 +1,179 @@
+#include "session/MessageHistory.h"
+
+#include <string>
+
+#include <gtest/gtest.h>
+
+#include "backends/HVReportingUtility.h"
+#include "platform/fake/FakePlatform.h"
+
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+using platform::Value;
+
+constexpr auto kPlayback = AudioEventCategory::kPlayback;
+constexpr auto kStart = AudioEventType::kStart;
+constexpr auto kState = AudioEventType::kState;
+
+class MessageHistoryTest : public testing::Test {
+ protected:
+  void append(AudioEventCategory category, AudioEventType type, const Dictionary& message) {
+    history_.append(history_.base(category, type), message);
+  }
+
+  platform::FakePlatform platform_;
+  MessageHistory history_;
+};
+
+TEST_F(MessageHistoryTest, IsEmptyAtFirst) {
+  EXPECT_TRUE(history_.empty());
+  EXPECT_EQ(history_.count("Playback_Start"), 0U);
+  EXPECT_EQ(history_.memorySize(), 0U);
+}
+
+TEST_F(MessageHistoryTest, NumbersTheMessagesOfOneBaseFromOneOn) {
+  append(kPlayback, kStart, {{"a", 1}});
+  append(kPlayback, kStart, {{"a", 2}});
+
+  EXPECT_EQ(history_[0].identifier(), "Playback_Start_1");
+  EXPECT_EQ(history_[1].identifier(), "Playback_Start_2");
+  EXPECT_EQ(history_.count("Playback_Start"), 2U);
+}
+
+TEST_F(MessageHistoryTest, NumbersEveryBaseByItself) {
+  append(kPlayback, kStart, {{"a", 1}});
+  append(kPlayback, kState, {{"a", 2}});
+  append(kPlayback | AudioEventCategory::kSession, kStart, {{"a", 3}});
+
+  EXPECT_EQ(history_[0].identifier(), "Playback_Start_1");
+  EXPECT_EQ(history_[1].identifier(), "Playback_State_1");
+  EXPECT_EQ(history_[2].identifier(), "Session_Playback_Start_1");
+}
+
+TEST_F(MessageHistoryTest, CategoriesWithTheSameTextShareABase) {
+  append(AudioEventCategory::kUndefined, kStart, {{"a", 1}});
+  append(AudioEventCategory{16}, kStart, {{"a", 2}});
+
+  EXPECT_EQ(history_[1].identifier(), "Undefined_Start_2");
+}
+
+TEST_F(MessageHistoryTest, KeepsTheOrderOfAcceptance) {
+  append(kPlayback, kStart, {{"a", 1}});
+  append(kPlayback, kState, {{"a", 2}});
+  append(kPlayback, kStart, {{"a", 3}});
+
+  std::string order;
+  for (const MessageHistory::Entry& entry : history_) order += describe(entry.message());
+  EXPECT_EQ(order, "{a = 1}{a = 2}{a = 3}");
+}
+
+TEST_F(MessageHistoryTest, FindsTheNewestMessageOfABaseBehindThoseOfOthers) {
+  append(kPlayback, kStart, {{"a", 1}});
+  append(kPlayback, kStart, {{"a", 2}});
+  append(kPlayback, kState, {{"a", 3}});
+
+  const Dictionary* newest = history_.newestMessage(history_.base(kPlayback, kStart));
+
+  ASSERT_NE(newest, nullptr);
+  EXPECT_EQ(*newest, (Dictionary{{"a", 2}}));
+}
+
+TEST_F(MessageHistoryTest, HasNoNewestMessageOfANewBase) {
+  EXPECT_EQ(history_.newestMessage(history_.base(kPlayback, kStart)), nullptr);
+}
+
+TEST_F(MessageHistoryTest, StaysWholeWhenItIsMoved) {
+  append(kPlayback, kStart, {{"a", 1}});
+
+  MessageHistory moved = std::move(history_);
+  moved.append(moved.base(kPlayback, kStart), {{"a", 2}});
+
+  EXPECT_EQ(moved[0].identifier(), "Playback_Start_1");
+  EXPECT_EQ(moved[1].identifier(), "Playback_Start_2");
+}
+
+TEST_F(MessageHistoryTest, CodesBeyondTheBoundStillFindTheirBase) {
+  constexpr std::uint32_t kManyCodes = 10'000;
+  for (std::uint32_t code = 0; code < kManyCodes; ++code) {
+    append(AudioEventCategory{0x0001'0000U * (code + 1) + 4}, kStart, {{"a", code}});
+  }
+
+  // Four of them are a domain that has a text; all others share one base.
+  EXPECT_EQ(history_.count("_Playback_Start"), kManyCodes - 4);
+  EXPECT_EQ(history_.count("Session_Playback_Start"), 1U);
+}
+
+TEST_F(MessageHistoryTest, AMessageOfTenFieldsCostsAtMostFiveHundredBytes) {
+  Dictionary message;
+  for (int field = 0; field < 10; ++field)
+    message.set("field" + std::to_string(field), field * 0.5);
+  message.set("hvreporting_timestamp", 1.7e9);
+  message.set("systemuptime_sec", 1000);
+  message.set("processuptime_ms", 1000);
+  append(kPlayback, kStart, HVReportingUtilityAddAudioMessageTag(message, kPlayback, kStart));
+  const std::size_t before = history_.memorySize();
+
+  append(kPlayback, kStart, HVReportingUtilityAddAudioMessageTag(message, kPlayback, kStart));
+
+  EXPECT_LE(history_.memorySize() - before, 500U);
+  EXPECT_GE(history_.memorySize() - before, 14 * sizeof(Dictionary::Entry));
+}
+
+class EqualApartFromVolatileKeysTest : public testing::Test {
+ protected:
+  platform::FakePlatform platform_;
+};
+
+TEST_F(EqualApartFromVolatileKeysTest, EmptyMessagesAreEqual) {
+  EXPECT_TRUE(equalApartFromVolatileKeys({}, {}));
+}
+
+TEST_F(EqualApartFromVolatileKeysTest, VolatileKeysMayDiffer) {
+  const Dictionary left{
+      {"hvreporting_timestamp", 1.5}, {"a", 1}, {"systemuptime_sec", 1}, {"processuptime_ms", 1}};
+  const Dictionary right{
+      {"hvreporting_timestamp", 2.5}, {"a", 1}, {"systemuptime_sec", 2}, {"processuptime_ms", 2}};
+  EXPECT_TRUE(equalApartFromVolatileKeys(left, right));
+}
+
+TEST_F(EqualApartFromVolatileKeysTest, VolatileKeysMayBeMissingOnEitherSide) {
+  const Dictionary with{{"processuptime_ms", 1}, {"a", 1}};
+  const Dictionary without{{"a", 1}};
+  EXPECT_TRUE(equalApartFromVolatileKeys(with, without));
+  EXPECT_TRUE(equalApartFromVolatileKeys(without, with));
+  EXPECT_TRUE(equalApartFromVolatileKeys({{"processuptime_ms", 1}}, {{"systemuptime_sec", 1}}));
+}
+
+TEST_F(EqualApartFromVolatileKeysTest, OtherKeysMayNotBeMissing) {
+  const Dictionary with{{"a", 1}, {"b", 1}};
+  EXPECT_FALSE(equalApartFromVolatileKeys(with, {{"a", 1}}));
+  EXPECT_FALSE(equalApartFromVolatileKeys({{"a", 1}}, with));
+  EXPECT_FALSE(equalApartFromVolatileKeys({{"a", 1}, {"processuptime_ms", 1}}, with));
+  EXPECT_FALSE(equalApartFromVolatileKeys({{"a", 1}, {"b", 1}}, {{"a", 1}, {"c", 1}}));
+}
+
+TEST_F(EqualApartFromVolatileKeysTest, OrderDoesNotMatter) {
+  const Dictionary left{{"a", 1}, {"processuptime_ms", 1}, {"b", 2}};
+  const Dictionary right{{"b", 2}, {"a", 1}, {"processuptime_ms", 9}};
+  EXPECT_TRUE(equalApartFromVolatileKeys(left, right));
+  EXPECT_FALSE(equalApartFromVolatileKeys(left, {{"b", 2}, {"a", 2}, {"processuptime_ms", 1}}));
+}
+
+TEST_F(EqualApartFromVolatileKeysTest, ComparesNestedValuesDeeplyAndNumbersByValue) {
+  const Dictionary left{{"list", platform::Array{Dictionary{{"n", 1}}, "x"}}};
+  EXPECT_TRUE(
+      equalApartFromVolatileKeys(left, {{"list", platform::Array{Dictionary{{"n", 1.0}}, "x"}}}));
+  EXPECT_FALSE(
+      equalApartFromVolatileKeys(left, {{"list", platform::Array{Dictionary{{"n", 2}}, "x"}}}));
+}
+
+TEST_F(EqualApartFromVolatileKeysTest, VolatileNamesInsideNestedValuesCount) {
+  const Dictionary left{{"inner", Dictionary{{"systemuptime_sec", 1}}}};
+  const Dictionary right{{"inner", Dictionary{{"systemuptime_sec", 2}}}};
+  EXPECT_FALSE(equalApartFromVolatileKeys(left, right));
+}
+
+}  // namespace
+}  // namespace halvox
