@@ -1,0 +1,233 @@
+#include "client/ClientWorker.h"
+
+#include <algorithm>
+#include <array>
+#include <csignal>
+#include <utility>
+
+#include <pthread.h>
+#include <sys/eventfd.h>
+
+namespace halvox::client {
+namespace {
+
+using platform::linux_::MutexLock;
+
+constexpr std::size_t kMaxWaitingOperations = 8192;
+constexpr std::chrono::seconds kFarewell{1};
+// How often to look for work where the system gave no descriptor to be woken through.
+constexpr std::chrono::milliseconds kPauseWithoutWakeUp{50};
+
+// Threads inherit the signal mask. The program's signals are for its own threads.
+class SignalsBlocked {
+ public:
+  SignalsBlocked() {
+    sigset_t all;
+    sigfillset(&all);
+    pthread_sigmask(SIG_SETMASK, &all, &previous_);
+  }
+  ~SignalsBlocked() { pthread_sigmask(SIG_SETMASK, &previous_, nullptr); }
+  SignalsBlocked(const SignalsBlocked&) = delete;
+  SignalsBlocked& operator=(const SignalsBlocked&) = delete;
+
+ private:
+  sigset_t previous_{};
+};
+
+Options withDefaults(Options options) {
+  if (options.socketPath.empty()) options.socketPath = defaultSocketPath();
+  options.reconnectMin = std::max(options.reconnectMin, std::chrono::milliseconds(1));
+  options.reconnectMax = std::max(options.reconnectMax, options.reconnectMin);
+  return options;
+}
+
+}  // namespace
+
+ClientWorker::ClientWorker(Options options)
+    : options_(withDefaults(std::move(options))),
+      ring_(options_.maxPendingMessages, options_.maxPendingBytes),
+      wakeUp_(eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)),
+      watch_(options_.socketPath),
+      pause_(options_.reconnectMin) {
+  const SignalsBlocked blocked;
+  thread_ = std::jthread([this] { run(); });
+}
+
+ClientWorker::~ClientWorker() {
+  closing_.store(true, std::memory_order_relaxed);
+  bool waiting = counters().pending > 0;
+  {
+    const MutexLock lock(mutex_);
+    waiting = waiting || !lane_.empty();
+  }
+  if (waiting) flush(kFarewell);
+  {
+    const MutexLock lock(mutex_);
+    endNow_ = true;
+  }
+  wake();
+}
+
+bool ClientWorker::send(OutgoingMessage&& message) {
+  // Relaxed: a program that sends while it destroys its client races with itself anyway.
+  if (closing_.load(std::memory_order_relaxed) || !ring_.tryPush(std::move(message))) {
+    dropped_.fetch_add(1, std::memory_order_relaxed);
+    return false;
+  }
+  // Only a thread that sleeps for want of work is woken: a system call per message saved.
+  if (asleep_.load(std::memory_order_seq_cst) && asleep_.exchange(false)) wake();
+  return true;
+}
+
+void ClientWorker::post(SessionOperation operation) {
+  {
+    const MutexLock lock(mutex_);
+    wanted_.apply(operation);
+    if (lane_.size() >= kMaxWaitingOperations) overflowed_ = true;
+    if (!overflowed_) {
+      lane_.push_back({ring_.tail(), std::move(operation)});
+      lanePosition_.store(lane_.front().position, std::memory_order_release);
+    }
+  }
+  wake();
+}
+
+bool ClientWorker::flush(std::chrono::milliseconds timeout) {
+  // The handler runs on the thread that would have to do it.
+  if (std::this_thread::get_id() == thread_.get_id()) return false;
+  const TimePoint deadline = std::chrono::steady_clock::now() + timeout;
+  const MutexLock lock(mutex_);
+  const std::uint64_t position = ring_.tail();
+  // Flushes with nothing between them share a ticket, so that they cannot fill the lane.
+  const bool shares = !lane_.empty() && lane_.back().position == position &&
+                      std::holds_alternative<FlushTicket>(lane_.back().step);
+  if (!shares) {
+    lane_.push_back({position, ++flushAsked_});
+    lanePosition_.store(lane_.front().position, std::memory_order_release);
+  }
+  const FlushTicket ticket = flushAsked_;
+  wake();
+  while (flushDone_ < ticket && !endNow_) {
+    if (!flushed_.waitUntil(mutex_, deadline)) break;
+  }
+  return flushDone_ >= ticket;
+}
+
+void ClientWorker::setConnectionHandler(std::function<void(bool)> handler) {
+  {
+    const MutexLock lock(mutex_);
+    handler_ = handler ? std::make_shared<ConnectionHandler>(std::move(handler)) : nullptr;
+    handlerIsNew_ = handler_ != nullptr;
+  }
+  wake();
+}
+
+Counters ClientWorker::counters() const {
+  Counters counters;
+  counters.dropped = dropped_.load(std::memory_order_relaxed);
+  counters.acknowledged = acknowledged_.load(std::memory_order_acquire);
+  counters.refused = refused_.load(std::memory_order_acquire);
+  counters.lost = lost_.load(std::memory_order_acquire);
+  counters.reconnects = reconnects_.load(std::memory_order_relaxed);
+  // Read last, so that nothing was settled without having been accepted.
+  counters.accepted = ring_.tail();
+  counters.pending = counters.accepted - counters.acknowledged - counters.refused - counters.lost;
+  return counters;
+}
+
+void ClientWorker::wake() const {
+  const std::uint64_t one = 1;
+  // Can only fail when the thread has been woken already, or there is no descriptor at all.
+  static_cast<void>(!write(wakeUp_.get(), &one, sizeof one));
+}
+
+void ClientWorker::run() {
+  pthread_setname_np(pthread_self(), "halvox-client");
+  while (!isEnding()) {
+    giveUpWaitingIfOverflowed();
+    notifyNewHandler();
+    if (state_ == State::kAbsent && std::chrono::steady_clock::now() >= retryAt_) tryConnect();
+    processBus();
+    while (isWindowOpen() && sendNext()) {
+    }
+    if (mayFallAsleep()) sleepUntilSomethingHappens();
+  }
+  bus_.reset();
+}
+
+bool ClientWorker::isEnding() {
+  const MutexLock lock(mutex_);
+  return endNow_;
+}
+
+bool ClientWorker::mayFallAsleep() {
+  if (!isWindowOpen()) return true;  // the socket or the clock wakes, not a producer
+  asleep_.store(true, std::memory_order_seq_cst);
+  const bool hasWork =
+      ring_.isReady() || lanePosition_.load(std::memory_order_acquire) <= ring_.head();
+  if (hasWork) asleep_.store(false, std::memory_order_seq_cst);
+  return !hasWork;
+}
+
+ClientWorker::TimePoint ClientWorker::nextDeadline() const {
+  TimePoint deadline = TimePoint::max();
+  if (state_ == State::kAbsent) deadline = retryAt_;
+  if (state_ == State::kConnecting) deadline = handshakeEnds_;
+  std::uint64_t busDeadline = UINT64_MAX;  // microseconds of the same clock
+  if (bus_ && sd_bus_get_timeout(bus_.get(), &busDeadline) >= 0 && busDeadline != UINT64_MAX) {
+    deadline = std::min(deadline, TimePoint(std::chrono::microseconds(busDeadline)));
+  }
+  if (!wakeUp_) {
+    deadline = std::min(deadline, std::chrono::steady_clock::now() + kPauseWithoutWakeUp);
+  }
+  return deadline;
+}
+
+void ClientWorker::sleepUntilSomethingHappens() {
+  // poll() passes over negative descriptors.
+  std::array<pollfd, 3> polled{{{wakeUp_.get(), POLLIN, 0}, {watch_.fd(), POLLIN, 0}, {-1, 0, 0}}};
+  if (bus_) {
+    const int events = sd_bus_get_events(bus_.get());
+    polled[2] = {sd_bus_get_fd(bus_.get()), static_cast<short>(std::max(events, 0)), 0};
+  }
+  const TimePoint deadline = nextDeadline();
+  timespec remaining{};
+  if (deadline != TimePoint::max()) {
+    const auto left = std::max(deadline - std::chrono::steady_clock::now(),
+                               std::chrono::steady_clock::duration::zero());
+    const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(left);
+    remaining = {.tv_sec = seconds.count(), .tv_nsec = (left - seconds).count()};
+  }
+  ppoll(polled.data(), polled.size(), deadline == TimePoint::max() ? nullptr : &remaining, nullptr);
+  asleep_.store(false, std::memory_order_seq_cst);
+  if ((polled[0].revents & POLLIN) != 0) {
+    std::uint64_t count = 0;
+    static_cast<void>(!read(wakeUp_.get(), &count, sizeof count));
+  }
+  if (polled[1].revents != 0 && watch_.takeAppeared()) retryNow();
+}
+
+void ClientWorker::giveUpWaitingIfOverflowed() {
+  std::uint64_t end = 0;
+  {
+    const MutexLock lock(mutex_);
+    if (!overflowed_) return;
+    for (const auto& entry : lane_) {
+      const auto* ticket = std::get_if<FlushTicket>(&entry.step);
+      if (ticket != nullptr) interruptedFlushes_.push_back(*ticket);
+    }
+    lane_.clear();
+    lanePosition_.store(UINT64_MAX, std::memory_order_release);
+    overflowed_ = false;
+    made_ = wanted_;
+    end = ring_.tail();
+  }
+  while (ring_.head() < end && ring_.isReady()) {
+    ring_.pop();
+    lost_.fetch_add(1, std::memory_order_release);
+  }
+  // A new connection is the shortest way from any sessions to those that are wanted now.
+  if (state_ != State::kAbsent) loseConnection();
+}
+
+}  // namespace halvox::client

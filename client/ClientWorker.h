@@ -1,0 +1,160 @@
+#pragma once
+
+#include <atomic>
+#include <chrono>
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <list>
+#include <memory>
+#include <optional>
+#include <thread>
+
+#include <poll.h>
+
+#include "client/HalvoxClient.h"
+#include "client/MessageRing.h"
+#include "client/PeerBus.h"
+#include "client/SessionTable.h"
+#include "client/SocketWatch.h"
+#include "platform/linux/Mutex.h"
+#include "platform/linux/UniqueHandle.h"
+
+namespace halvox::client {
+
+// The thread behind a HalvoxClient and the two lanes that lead to it.
+//
+//   send() ──► MessageRing ─────────┐
+//                                   ├─► window of open calls ──► socket
+//   session operations ──► lane ────┘
+//
+// Messages go through the ring. Session operations and flushes are few: they go through a lane
+// under a lock, and each notes how many messages the ring had taken before it, so that the worker
+// carries everything out in the order of the calls.
+//
+//   absent ──socket connects──► connecting ──handshake──► ready
+//     ▲                            │                        │
+//     └────────pause, watch────────┴────────────────────────┘
+//
+// The worker never blocks on the socket: calls are sent while fewer than kMaxOpenCalls are open,
+// and answers are read all the time, so two sides that are both busy writing cannot wait for each
+// other. While nobody answers nothing is taken from the lanes, so they fill up to their bounds.
+//
+// A lane that overflows while the service is away (kMaxWaitingOperations) is given up as a whole,
+// with the messages that wait: they count as lost, and the sessions are made as they are by then.
+class ClientWorker {
+ public:
+  explicit ClientWorker(Options options);
+  // Delivers what is pending for at most a second, then ends the thread.
+  ~ClientWorker();
+  ClientWorker(const ClientWorker&) = delete;
+  ClientWorker& operator=(const ClientWorker&) = delete;
+
+  // Any thread; see HalvoxClient.
+  bool send(OutgoingMessage&& message);
+  void post(SessionOperation operation);
+  bool flush(std::chrono::milliseconds timeout);
+  void setConnectionHandler(std::function<void(bool)> handler);
+  // Orders with nothing: it is news about the past either way.
+  [[nodiscard]] bool isConnected() const { return connected_.load(std::memory_order_relaxed); }
+  [[nodiscard]] Counters counters() const;
+
+ private:
+  using TimePoint = std::chrono::steady_clock::time_point;
+  using FlushTicket = std::uint64_t;
+  using ConnectionHandler = std::function<void(bool)>;
+  enum class State : std::uint8_t { kAbsent, kConnecting, kReady };
+  enum class CallOutcome : std::uint8_t { kSent, kNoWireForm, kDisconnected };
+
+  // A session operation, or a flush, and how many messages go before it.
+  struct LaneEntry {
+    std::uint64_t position = 0;
+    std::variant<SessionOperation, FlushTicket> step;
+  };
+  // A call that the service has not answered. One for a flush stays until all before it are gone.
+  struct OpenCall {
+    ClientWorker* worker = nullptr;
+    std::list<OpenCall>::iterator self{};
+    std::size_t bytes = 0;
+    bool isMessage = false;
+    FlushTicket flush = 0;  // 0: none
+    bool isAnswered = false;
+  };
+
+  // The loop, and its sleep.
+  void run();
+  [[nodiscard]] bool isEnding();
+  void wake() const;
+  [[nodiscard]] bool mayFallAsleep();
+  void sleepUntilSomethingHappens();
+  [[nodiscard]] TimePoint nextDeadline() const;
+
+  // The connection.
+  void tryConnect();
+  void processBus();
+  void onReady();
+  void loseConnection();
+  void pauseBeforeRetry();
+  void retryNow();
+  void notifyConnection(bool connected);
+  void notifyNewHandler();
+
+  // What goes out.
+  [[nodiscard]] bool isWindowOpen() const;
+  bool sendNext();
+  void sendFromLane();
+  void sendOperation(const SessionOperation& operation);
+  void sendFlush(FlushTicket ticket);
+  void sendMessageAtHead();
+  CallOutcome call(Request&& request, OpenCall&& description);
+  void giveUpWaitingIfOverflowed();
+
+  // What comes back.
+  static int onReply(sd_bus_message* answer, void* userData, sd_bus_error* error);
+  void onAnswer(OpenCall& call, bool isError);
+  void finishFlushes();
+
+  const Options options_;
+  MessageRing ring_;
+  platform::linux_::UniqueFd wakeUp_;
+  std::atomic<bool> asleep_{false};  // sequentially consistent with the slots of the ring
+  std::atomic<bool> closing_{false};
+  std::atomic<bool> connected_{false};
+  std::atomic<std::uint64_t> dropped_{0};
+  // Written by the worker only. Released after, and acquired before, what `tail()` tells.
+  std::atomic<std::uint64_t> acknowledged_{0};
+  std::atomic<std::uint64_t> refused_{0};
+  std::atomic<std::uint64_t> lost_{0};
+  std::atomic<std::uint64_t> reconnects_{0};
+  // The position of the first entry of the lane. Written under the lock; a producer's own entries
+  // come before its messages because a message is published after it.
+  std::atomic<std::uint64_t> lanePosition_{UINT64_MAX};
+
+  platform::linux_::Mutex mutex_;
+  platform::linux_::Condition flushed_;
+  std::deque<LaneEntry> lane_ HALVOX_GUARDED_BY(mutex_);
+  SessionTable wanted_ HALVOX_GUARDED_BY(mutex_);  // after all operations that were posted
+  bool overflowed_ HALVOX_GUARDED_BY(mutex_) = false;
+  std::shared_ptr<ConnectionHandler> handler_ HALVOX_GUARDED_BY(mutex_);
+  bool handlerIsNew_ HALVOX_GUARDED_BY(mutex_) = false;
+  FlushTicket flushAsked_ HALVOX_GUARDED_BY(mutex_) = 0;
+  FlushTicket flushDone_ HALVOX_GUARDED_BY(mutex_) = 0;
+  bool endNow_ HALVOX_GUARDED_BY(mutex_) = false;
+
+  // The worker's own.
+  SocketWatch watch_;
+  State state_ = State::kAbsent;
+  TimePoint retryAt_{};
+  TimePoint handshakeEnds_{};
+  std::chrono::milliseconds pause_;
+  bool everConnected_ = false;
+  SessionTable made_;                      // after all operations that were sent
+  std::deque<SessionOperation> remaking_;  // before anything else of the lanes
+  std::deque<FlushTicket> interruptedFlushes_;
+  std::list<OpenCall> open_;  // oldest first; starts, which are answered at the stop, are not here
+  std::size_t openBytes_ = 0;
+  Bus bus_;
+  std::jthread thread_;
+};
+
+}  // namespace halvox::client

@@ -1,0 +1,70 @@
+#include "client/HalvoxClient.h"
+
+#include <cstdlib>
+#include <utility>
+
+#include "client/ClientWorker.h"
+
+namespace halvox::client {
+
+class HalvoxClient::Impl {
+ public:
+  explicit Impl(Options options) : worker(std::move(options)) {}
+  ClientWorker worker;
+};
+
+HalvoxClient::HalvoxClient(Options options) : impl_(std::make_unique<Impl>(std::move(options))) {}
+
+HalvoxClient::~HalvoxClient() = default;
+
+void HalvoxClient::createSession(ReporterID id) { impl_->worker.post({id, CreateSession{}}); }
+
+void HalvoxClient::setServiceType(ReporterID id, ServiceType type) {
+  impl_->worker.post({id, type});
+}
+
+void HalvoxClient::setConfiguration(ReporterID id, Dictionary configuration) {
+  impl_->worker.post({id, std::move(configuration)});
+}
+
+void HalvoxClient::start(ReporterID id) { impl_->worker.post({id, StartSession{}}); }
+
+void HalvoxClient::stop(ReporterID id) { impl_->worker.post({id, StopSession{}}); }
+
+void HalvoxClient::destroySession(ReporterID id) { impl_->worker.post({id, DestroySession{}}); }
+
+bool HalvoxClient::send(ReporterID id, Dictionary message, Category category, EventType type) {
+  return impl_->worker.send({id, std::move(message), category, type});
+}
+
+bool HalvoxClient::send(std::optional<std::vector<ReporterID>> ids, Dictionary message,
+                        Category category, EventType type) {
+  Recipients recipients;
+  if (ids) recipients = std::move(*ids);
+  return impl_->worker.send({std::move(recipients), std::move(message), category, type});
+}
+
+bool HalvoxClient::flush(std::chrono::milliseconds timeout) { return impl_->worker.flush(timeout); }
+
+bool HalvoxClient::isConnected() const { return impl_->worker.isConnected(); }
+
+Counters HalvoxClient::counters() const { return impl_->worker.counters(); }
+
+void HalvoxClient::setConnectionHandler(std::function<void(bool connected)> handler) {
+  impl_->worker.setConnectionHandler(std::move(handler));
+}
+
+std::string defaultSocketPath() {
+  constexpr const char* kBelowRuntimeDirectory = "/halvox/reporting.sock";
+  const auto variable = [](const char* name) {
+    const char* value = std::getenv(name);
+    return std::string(value != nullptr ? value : "");
+  };
+  if (auto path = variable("HALVOX_SOCKET"); !path.empty()) return path;
+  if (auto directory = variable("XDG_RUNTIME_DIR"); !directory.empty()) {
+    return directory + kBelowRuntimeDirectory;
+  }
+  return std::string("/run") + kBelowRuntimeDirectory;
+}
+
+}  // namespace halvox::client

@@ -1,0 +1,54 @@
+#include "client/SessionTable.h"
+
+#include <algorithm>
+
+namespace halvox::client {
+namespace {
+
+template <typename... Cases>
+struct Overloaded : Cases... {
+  using Cases::operator()...;
+};
+template <typename... Cases>
+Overloaded(Cases...) -> Overloaded<Cases...>;
+
+}  // namespace
+
+void SessionTable::apply(const SessionOperation& operation) {
+  if (std::holds_alternative<CreateSession>(operation.step)) {
+    sessions_[operation.id] = {.order = created_++, .type = {}, .configuration = {}};
+    return;
+  }
+  const auto found = sessions_.find(operation.id);
+  if (found == sessions_.end()) return;
+  Session& session = found->second;
+  std::visit(
+      Overloaded{
+          [](const CreateSession&) {},  // has returned above
+          [&](ServiceType type) { session.type = type; },
+          [&](const Dictionary& configuration) { session.configuration.merge(configuration); },
+          [&](const StartSession&) { session.running = true; },
+          [&](const StopSession&) { session.running = false; },
+          [&](const DestroySession&) { sessions_.erase(found); },
+      },
+      operation.step);
+}
+
+std::vector<SessionOperation> SessionTable::remake() const {
+  std::vector<const decltype(sessions_)::value_type*> inOrder;
+  inOrder.reserve(sessions_.size());
+  for (const auto& entry : sessions_) inOrder.push_back(&entry);
+  std::ranges::sort(inOrder, {}, [](const auto* entry) { return entry->second.order; });
+
+  std::vector<SessionOperation> operations;
+  for (const auto* entry : inOrder) {
+    const auto& [id, session] = *entry;
+    operations.push_back({id, CreateSession{}});
+    if (session.type) operations.push_back({id, *session.type});
+    if (!session.configuration.empty()) operations.push_back({id, session.configuration});
+    if (session.running) operations.push_back({id, StartSession{}});
+  }
+  return operations;
+}
+
+}  // namespace halvox::client

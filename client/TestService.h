@@ -1,0 +1,117 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <list>
+#include <map>
+#include <string>
+#include <string_view>
+#include <thread>
+#include <vector>
+
+#include <systemd/sd-bus.h>
+
+#include "client/HalvoxClient.h"
+#include "platform/linux/Mutex.h"
+#include "platform/linux/UniqueHandle.h"
+
+namespace halvox::client {
+
+// A request that the test service got.
+struct RecordedCall {
+  std::string member;
+  std::vector<Value> arguments;
+};
+
+// Plays the reporting service for tests of clients: answers as the protocol says, notes every
+// request, and can be made to stall, to refuse, to vanish and to come back.
+// One thread of its own serves all connections. Any thread may call the public operations.
+class TestService {
+ public:
+  // Listens at that path at once.
+  explicit TestService(std::string socketPath);
+  ~TestService();
+  TestService(const TestService&) = delete;
+  TestService& operator=(const TestService&) = delete;
+
+  // A stalled service keeps its connections but reads nothing from them and accepts none.
+  void setStalled(bool stalled);
+  // Ends every connection and removes the socket; come() listens again.
+  void vanish();
+  void come();
+  // From now on requests of that member are answered with an error. The empty name ends that.
+  void refuse(std::string member, std::string errorName = "com.tarno.audio.reporting.Code1");
+
+  [[nodiscard]] std::vector<RecordedCall> calls();
+  [[nodiscard]] std::size_t count(std::string_view member);
+  // Waits until as many requests of that member have come; false when they do not come in time.
+  [[nodiscard]] bool waitForCalls(std::string_view member, std::size_t count);
+  // The members of all requests in their order, separated by blanks.
+  [[nodiscard]] std::string members();
+
+ private:
+  using Message = platform::linux_::UniqueHandle<sd_bus_message*, sd_bus_message_unref>;
+  using BusHandle = platform::linux_::UniqueHandle<sd_bus*, sd_bus_close_unref>;
+  using Job = std::function<void()>;
+
+  struct Session {
+    ServiceType type = 65535;
+    bool running = false;
+    Message heldStart;
+  };
+  struct Connection {
+    TestService* service = nullptr;
+    BusHandle bus;
+    std::map<ReporterID, Session> sessions;
+  };
+
+  void run();
+  void perform(Job job);  // on the service's thread, and waits for it
+  void listen();
+  void leave();
+  void accept();
+  void serve(Connection& connection);
+  static int onMessage(sd_bus_message* message, void* userData, sd_bus_error* error);
+  int answer(Connection& connection, sd_bus_message* message);
+  int answerSessionRequest(Connection& connection, sd_bus_message* message,
+                           const RecordedCall& call);
+  int answerQuery(sd_bus_message* message, const RecordedCall& call);
+  Session* find(ReporterID id);
+
+  const std::string socketPath_;
+  platform::linux_::UniqueFd wakeUp_;
+  platform::linux_::Mutex mutex_;
+  platform::linux_::Condition changed_;
+  std::vector<RecordedCall> calls_ HALVOX_GUARDED_BY(mutex_);
+  std::list<Job> jobs_ HALVOX_GUARDED_BY(mutex_);
+  std::size_t jobsDone_ HALVOX_GUARDED_BY(mutex_) = 0;
+  std::size_t jobsAsked_ HALVOX_GUARDED_BY(mutex_) = 0;
+  // The thread's own.
+  bool stalled_ = false;
+  bool leaving_ = false;
+  bool ended_ = false;
+  std::string refusedMember_;
+  std::string errorName_;
+  platform::linux_::UniqueFd listener_;
+  std::list<Connection> connections_;
+  std::jthread thread_;
+};
+
+// A new directory of a test's own, removed with all that is in it.
+class ScratchDirectory {
+ public:
+  ScratchDirectory();
+  ~ScratchDirectory();
+  ScratchDirectory(const ScratchDirectory&) = delete;
+  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
+  [[nodiscard]] std::string path(std::string_view name) const;
+
+ private:
+  std::string path_;
+};
+
+// Waits until something holds, looking often, for as long as a slow machine may need.
+[[nodiscard]] bool eventually(const std::function<bool()>& holds);
+
+}  // namespace halvox::client
