@@ -182,7 +182,7 @@ Value Decoder::decodeVariant(unsigned level) {
 Value Decoder::decodeData() {
   std::size_t outerLimit = 0;
   if (!reader_.enterArray(1, outerLimit)) return malformed("ay");
-  const Data data(reader_.takeRest());
+  Data data(reader_.takeRest());
   reader_.leaveArray(outerLimit);
   return data;
 }
@@ -192,10 +192,10 @@ Value Decoder::decodeArray(std::string_view type, unsigned level) {
   std::size_t outerLimit = 0;
   if (!reader_.enterArray(alignmentOf(elementType.front()), outerLimit)) return malformed(type);
   const std::size_t first = scratch_.values.size();
-  while (!reader_.atLimit()) {
+  for (std::size_t element = 0; !reader_.atLimit(); ++element) {
     scratch_.values.push_back(decode(elementType, level));
     if (failed_) {
-      path_.putBefore(scratch_.values.size() - 1 - first);
+      path_.putBefore(element);
       return {};
     }
   }
