@@ -43,6 +43,11 @@ bool equalsDouble(std::int64_t bits, bool isSigned, double number) {
          static_cast<std::uint64_t>(number) == static_cast<std::uint64_t>(bits);
 }
 
+// A NaN equals every NaN.
+bool equalDoubles(double left, double right) {
+  return left == right || (std::isnan(left) && std::isnan(right));
+}
+
 bool isFloating(NumberKind kind) { return kind >= NumberKind::kFloat; }
 
 bool isSigned(NumberKind kind) {
@@ -119,18 +124,16 @@ Value::Value(Value&& other) noexcept {
 
 // Retaining before releasing makes assigning a value to itself harmless.
 // NOLINTNEXTLINE(bugprone-unhandled-self-assignment)
+// The new content is taken before the old one goes: `other` may be this value or live inside it.
 Value& Value::operator=(const Value& other) noexcept {
-  other.retain();
-  release();
-  std::memmove(storage_, other.storage_, sizeof storage_);
+  Value taken(other);
+  std::swap(storage_, taken.storage_);
   return *this;
 }
 
 Value& Value::operator=(Value&& other) noexcept {
-  if (this == &other) return *this;
-  release();
-  std::memcpy(storage_, other.storage_, sizeof storage_);
-  other.setTag(Tag::kNone);
+  Value taken(std::move(other));
+  std::swap(storage_, taken.storage_);
   return *this;
 }
 
@@ -309,9 +312,7 @@ bool Value::equalNumbers(const Value& left, const Value& right) {
   const auto leftBits = left.payload<std::int64_t>();
   const auto rightBits = right.payload<std::int64_t>();
   if (isFloating(leftKind) && isFloating(rightKind)) {
-    const auto a = left.payload<double>();
-    const auto b = right.payload<double>();
-    return a == b || (std::isnan(a) && std::isnan(b));
+    return equalDoubles(left.payload<double>(), right.payload<double>());
   }
   if (isFloating(leftKind)) {
     return equalsDouble(rightBits, isSigned(rightKind), left.payload<double>());
@@ -333,7 +334,7 @@ bool operator==(const Value& left, const Value& right) {
     case ValueKind::kString:
       return left.string() == right.string();
     case ValueKind::kDate:
-      return left.date() == right.date();
+      return equalDoubles(left.date().secondsSince1970, right.date().secondsSince1970);
     case ValueKind::kData:
       return left.data() == right.data();
     case ValueKind::kArray:

@@ -25,7 +25,8 @@ struct Date {
 
 // A program constant whose identity is kept: a value made from a text that equals a constant is
 // that very constant, wherever the text came from, so clients in other processes can name it.
-// Make constants only with static storage and before the first thread starts.
+// Make constants only with static storage and before the first thread starts, of 64 bytes at most
+// and of different texts.
 class StringConstant {
  public:
   explicit StringConstant(std::string_view text);
@@ -130,8 +131,9 @@ enum class ValueKind : std::uint8_t { kNone, kNumber, kString, kDate, kData, kAr
 // value object belongs to one thread at a time, like any other plain object.
 //
 // Two values are equal when their contents are: numbers by value whatever their kind (1, 1.0 and
-// true are equal; a NaN equals every NaN, so that equal means interchangeable), strings and data
-// byte for byte, arrays element by element, dictionaries entry by entry in any order.
+// true are equal; a NaN equals every NaN, so that equal means interchangeable), dates by their
+// number, strings and data byte for byte, arrays element by element, dictionaries entry by entry in
+// any order.
 //
 // Strings are UTF-8; whoever makes a value from outside bytes checks that first.
 class Value {
@@ -162,7 +164,8 @@ class Value {
   // The kind of a number; only for numbers.
   [[nodiscard]] NumberKind numberKind() const;
   // A number read as the type asked for: fractions are cut off, what lies outside the type's range
-  // becomes its nearest end, a NaN becomes 0. Anything but a number gives 0.
+  // becomes its nearest end, a NaN becomes 0 as an integer. As a bool every number but 0 is true.
+  // Anything but a number gives 0.
   [[nodiscard]] std::int64_t toInt64() const;
   [[nodiscard]] std::uint64_t toUInt64() const;
   [[nodiscard]] double toDouble() const;
@@ -296,6 +299,9 @@ class Dictionary {
   [[nodiscard]] const Value* find(const Key& key) const;
   [[nodiscard]] const Value* find(std::string_view key) const;
   [[nodiscard]] const Value* find(const char* key) const { return find(std::string_view(key)); }
+  [[nodiscard]] const Value* find(const std::string& key) const {
+    return find(std::string_view(key));
+  }
   [[nodiscard]] bool contains(std::string_view key) const { return find(key) != nullptr; }
 
   // Makes room for that many entries in all, so that setting them allocates no more.

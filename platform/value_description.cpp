@@ -72,7 +72,7 @@ std::string describeData(const Data& data) {
 std::string describeArray(const Array& array) {
   std::string text = "(";
   for (const Value& value : array) {
-    if (text.size() > 1) text += ", ";
+    if (&value != array.begin()) text += ", ";
     text += describe(value);
   }
   return text + ")";

@@ -75,6 +75,9 @@ struct DictionaryRep {
   }
 };
 
+// A hash that differs from process to process, for tables whose keys come from clients.
+std::uint32_t secretHash(std::string_view text);
+
 void releaseData(DataRep* rep) noexcept;
 void releaseArray(ArrayRep* rep) noexcept;
 void releaseDictionary(DictionaryRep* rep) noexcept;

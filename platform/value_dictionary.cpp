@@ -1,6 +1,5 @@
 #include <algorithm>
 #include <cassert>
-#include <functional>
 
 #include "platform/value_detail.h"
 
@@ -21,7 +20,8 @@ DictionaryRep* allocateRep(std::size_t capacity) {
 
 void addToIndex(DictionaryRep& rep, std::uint32_t entry) {
   const std::uint32_t mask = rep.indexSize - 1;
-  std::uint32_t slot = rep.entries()[entry].key.hash() & mask;
+  // Not the key's own hash: a client can make keys that are alike in it.
+  std::uint32_t slot = detail::secretHash(rep.entries()[entry].key.text()) & mask;
   while (rep.index[slot] != 0) slot = (slot + 1) & mask;
   rep.index[slot] = entry + 1;
 }
@@ -45,8 +45,16 @@ void noteAppended(DictionaryRep& rep) {
   }
 }
 
+// A copy of another's index, for entries that are in the same order.
+void copyIndex(DictionaryRep& rep, const DictionaryRep& other) {
+  if (other.indexSize == 0) return;
+  rep.index = new std::uint32_t[other.indexSize];
+  rep.indexSize = other.indexSize;
+  std::copy_n(other.index, other.indexSize, rep.index);
+}
+
 template <typename Matches>
-Dictionary::Entry* findEntry(DictionaryRep* rep, std::uint32_t hash, const Matches& matches) {
+Dictionary::Entry* findEntry(DictionaryRep* rep, std::string_view key, const Matches& matches) {
   if (rep == nullptr) return nullptr;
   Dictionary::Entry* entries = rep->entries();
   if (rep->indexSize == 0) {
@@ -55,15 +63,16 @@ Dictionary::Entry* findEntry(DictionaryRep* rep, std::uint32_t hash, const Match
     return found == end ? nullptr : found;
   }
   const std::uint32_t mask = rep->indexSize - 1;
-  for (std::uint32_t slot = hash & mask; rep->index[slot] != 0; slot = (slot + 1) & mask) {
+  std::uint32_t slot = detail::secretHash(key) & mask;
+  for (; rep->index[slot] != 0; slot = (slot + 1) & mask) {
     Dictionary::Entry& entry = entries[rep->index[slot] - 1];
-    if (entry.key.hash() == hash && matches(entry)) return &entry;
+    if (matches(entry)) return &entry;
   }
   return nullptr;
 }
 
 Dictionary::Entry* findEntry(DictionaryRep* rep, const Key& key) {
-  return findEntry(rep, key.hash(),
+  return findEntry(rep, key.text(),
                    [&key](const Dictionary::Entry& entry) { return entry.key == key; });
 }
 
@@ -100,11 +109,8 @@ const Value* Dictionary::find(const Key& key) const {
 }
 
 const Value* Dictionary::find(std::string_view key) const {
-  if (rep_ == nullptr) return nullptr;
-  const auto hash =
-      rep_->indexSize == 0 ? 0 : static_cast<std::uint32_t>(std::hash<std::string_view>{}(key));
   const Entry* entry =
-      findEntry(rep_, hash, [key](const Entry& candidate) { return candidate.key.text() == key; });
+      findEntry(rep_, key, [key](const Entry& candidate) { return candidate.key.text() == key; });
   return entry == nullptr ? nullptr : &entry->value;
 }
 
@@ -129,7 +135,7 @@ void Dictionary::makeRoomFor(std::size_t entries) {
   } else {
     std::uninitialized_copy_n(rep_->entries(), rep_->count, grown->entries());
     grown->count = rep_->count;
-    buildIndex(*grown);
+    copyIndex(*grown, *rep_);
   }
   detail::releaseDictionary(std::exchange(rep_, grown));
 }
