@@ -1,6 +1,7 @@
 #include "reporters/pipewire/PipeWireSource.h"
 
 #include <chrono>
+#include <functional>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -43,8 +44,7 @@ class PipeWireSourceTest : public testing::Test {
   [[nodiscard]] bool waitFor(const std::string& operation, long count = 1) const {
     return waitUntil([&] { return std::ranges::count(client.operations(), operation) >= count; });
   }
-  template <typename Condition>
-  [[nodiscard]] bool waitUntil(Condition condition) const {
+  [[nodiscard]] bool waitUntil(const std::function<bool()>& condition) const {
     const auto end = steady_clock::now() + kDeadline;
     while (!condition()) {
       if (steady_clock::now() > end) {

@@ -30,6 +30,8 @@ inline constexpr const char* kDevicesKey = "active_devices";
 inline constexpr const char* kVolumeKey = "RQSessionVolume";
 inline constexpr const char* kPlayingKey = "RQSessionVolumePlayingState";
 inline constexpr const char* kVolumeProcessKey = "RQSessionVolumeOperationProcess";
+// Tells the streams of one application apart: the stream's object.serial, in every message.
+inline constexpr const char* kSerialKey = "object_serial";
 // Counts the runs of one stream from 1, so that a second Start is not a repeat of the first.
 inline constexpr const char* kRunKey = "run";
 // The stable names behind `kDevicesKey`, which is meant for people.

@@ -44,8 +44,7 @@ Route RouteGraph::routeOf(GlobalID stream, Direction direction) const {
     }
   }
   std::ranges::sort(route.devices);
-  const auto repeated = std::ranges::unique(route.devices);
-  route.devices.erase(repeated.begin(), repeated.end());
+  route.devices.erase(std::unique(route.devices.begin(), route.devices.end()), route.devices.end());
   return route;
 }
 

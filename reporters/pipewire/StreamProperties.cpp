@@ -32,7 +32,7 @@ constexpr std::array kTexts{
 
 constexpr std::array kNumbers{
     KeyName{"application.process.id", "process_id"},
-    KeyName{"object.serial", "object_serial"},
+    KeyName{"object.serial", kSerialKey},
 };
 
 struct RoleService {

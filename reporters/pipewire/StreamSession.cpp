@@ -40,25 +40,24 @@ platform::Array deviceNames(const Route& route) {
 
 }  // namespace
 
-StreamSession::StreamSession(ReportingClient& client, ReporterID id, Direction direction,
+StreamSession::StreamSession(ReportingClient& client, Identity identity,
                              const Properties& properties)
     : client_(client),
-      id_(id),
-      direction_(direction),
+      identity_(identity),
       serviceType_(serviceTypeForRole(property(properties, kRoleProperty))),
       configuration_(makeConfiguration(properties)),
       process_(processName(properties)) {
-  client_.createSession(id_);
-  client_.setServiceType(id_, serviceType_);
-  client_.setConfiguration(id_, configuration_);
+  client_.createSession(identity_.reporterID);
+  client_.setServiceType(identity_.reporterID, serviceType_);
+  client_.setConfiguration(identity_.reporterID, configuration_);
 }
 
 StreamSession::~StreamSession() {
   setRunning(false);
   if (started_) {
-    client_.stop(id_);
+    client_.stop(identity_.reporterID);
   }
-  client_.destroySession(id_);
+  client_.destroySession(identity_.reporterID);
 }
 
 void StreamSession::setProperties(const Properties& properties) {
@@ -66,13 +65,13 @@ void StreamSession::setProperties(const Properties& properties) {
   const ServiceType type = serviceTypeForRole(property(properties, kRoleProperty));
   if (type != serviceType_) {
     serviceType_ = type;
-    client_.setServiceType(id_, type);
+    client_.setServiceType(identity_.reporterID, type);
   }
   const platform::Dictionary changed =
       changedEntries(configuration_, makeConfiguration(properties));
   if (!changed.empty()) {
     configuration_.merge(changed);
-    client_.setConfiguration(id_, changed);
+    client_.setConfiguration(identity_.reporterID, changed);
   }
 }
 
@@ -130,7 +129,7 @@ void StreamSession::beginRun() {
   ++run_;
   if (!started_) {
     started_ = true;
-    client_.start(id_);
+    client_.start(identity_.reporterID);
     sendFormat();
     sendRoute();
   }
@@ -146,15 +145,14 @@ void StreamSession::endRun() {
 
 void StreamSession::sendFormat() {
   if (!format_.empty()) {
-    client_.send(id_, {{kFormatKey, format_}}, kCategorySessionSetup, kTypeSetup);
+    send({{kFormatKey, format_}}, kCategorySessionSetup, kTypeSetup);
   }
 }
 
 void StreamSession::sendRoute() {
   if (!route_.devices.empty()) {
-    client_.send(id_,
-                 {{kDevicesKey, describeRoute(route_)}, {kDeviceNamesKey, deviceNames(route_)}},
-                 kCategoryRouteChange, kTypeState);
+    send({{kDevicesKey, describeRoute(route_)}, {kDeviceNamesKey, deviceNames(route_)}},
+         kCategoryRouteChange, kTypeState);
   }
 }
 
@@ -169,19 +167,22 @@ void StreamSession::sendVolumeIfChanged() {
   }
   sentVolume_ = state;
   // PipeWire does not tell who turned a stream's volume, so it is put down to the stream's process.
-  client_.send(id_,
-               {{kVolumeKey, state.volume},
-                {kPlayingKey, state.playing ? 1 : 0},
-                {kVolumeProcessKey, process_}},
-               kCategoryVolume, kTypeState);
+  send({{kVolumeKey, state.volume},
+        {kPlayingKey, state.playing ? 1 : 0},
+        {kVolumeProcessKey, process_}},
+       kCategoryVolume, kTypeState);
 }
 
-void StreamSession::sendRun(EventType type) {
-  client_.send(id_, {{kRunKey, run_}}, category(), type);
+void StreamSession::sendRun(EventType type) { send({{kRunKey, run_}}, category(), type); }
+
+void StreamSession::send(platform::Dictionary message, Category category, EventType type) {
+  message.set(kSerialKey, identity_.serial);
+  client_.send(identity_.reporterID, message, category, type);
 }
 
 Category StreamSession::category() const {
-  return direction_ == Direction::kPlayback ? kCategorySessionPlayback : kCategorySessionRecord;
+  return identity_.direction == Direction::kPlayback ? kCategorySessionPlayback
+                                                     : kCategorySessionRecord;
 }
 
 }  // namespace halvox::pipewire_reporter

@@ -21,8 +21,13 @@ namespace halvox::pipewire_reporter {
 // change is sent once. Belongs to the loop thread; borrows the client, which must outlive it.
 class StreamSession {
  public:
-  StreamSession(ReportingClient& client, ReporterID id, Direction direction,
-                const Properties& properties);
+  struct Identity {
+    ReporterID reporterID = 0;
+    std::uint64_t serial = 0;
+    Direction direction = Direction::kPlayback;
+  };
+
+  StreamSession(ReportingClient& client, Identity identity, const Properties& properties);
   ~StreamSession();
   StreamSession(const StreamSession&) = delete;
   StreamSession& operator=(const StreamSession&) = delete;
@@ -36,7 +41,7 @@ class StreamSession {
   // Says again what holds now; for a service that has lost what it was told.
   void restate();
 
-  [[nodiscard]] Direction direction() const { return direction_; }
+  [[nodiscard]] Direction direction() const { return identity_.direction; }
 
  private:
   void beginRun();
@@ -45,6 +50,7 @@ class StreamSession {
   void sendRoute();
   void sendVolumeIfChanged();
   void sendRun(EventType type);
+  void send(platform::Dictionary message, Category category, EventType type);
   [[nodiscard]] Category category() const;
 
   struct VolumeState {
@@ -54,8 +60,7 @@ class StreamSession {
   };
 
   ReportingClient& client_;
-  const ReporterID id_;
-  const Direction direction_;
+  const Identity identity_;
   ServiceType serviceType_;
   platform::Dictionary configuration_;
   std::string process_;

@@ -114,7 +114,11 @@ void StreamTracker::addStream(const Node& node, Direction direction) {
     ++refusedStreams_;
     return;
   }
-  auto session = std::make_unique<StreamSession>(client_, reporterID, direction, node.properties);
+  auto session = std::make_unique<StreamSession>(
+      client_,
+      StreamSession::Identity{
+          .reporterID = reporterID, .serial = node.serial, .direction = direction},
+      node.properties);
   streams_.emplace(node.id, Entry{.reporterID = reporterID, .session = std::move(session)});
   updateRoute(node.id);
 }

@@ -143,9 +143,10 @@ TEST_F(StreamTrackerTest, TellsVolumePlayingStateAndProcess) {
 
   tracker.streamRunningChanged(kStream, true);
 
-  EXPECT_EQ(
-      client.last("volume"),
-      (platform::Dictionary{{kVolumeKey, 0.25}, {kPlayingKey, 1}, {kVolumeProcessKey, "player"}}));
+  EXPECT_EQ(client.last("volume"), (platform::Dictionary{{kVolumeKey, 0.25},
+                                                         {kPlayingKey, 1},
+                                                         {kVolumeProcessKey, "player"},
+                                                         {kSerialKey, kSerial}}));
 }
 
 TEST_F(StreamTrackerTest, TellsVolumeWhenItChanges) {

@@ -141,6 +141,7 @@ halvox_progress_in() {
 # Shows that it goes on: a spinner with the seconds at a terminal, a line every ten seconds
 # elsewhere. When it fails, shows the end of its output and returns its status.
 halvox_run() {
+  # shellcheck disable=SC1003  # that is a backslash, no quoting
   local what=$1 log=$2 pid status=0 begin=$SECONDS told=0 ticks=0 spinner='|/-\'
   shift 2
   : >"$log"

@@ -33,7 +33,7 @@ halvox_audio_write_configuration() {
   local directory=$1
   mkdir -p "$directory/config/wireplumber/main.lua.d" \
     "$directory/config/wireplumber/bluetooth.lua.d" "$directory/state"
-  mkdir -p -m 700 "$directory/run"
+  mkdir -m 700 "$directory/run"
   # On a machine with sound cards: hands off them.
   printf '%s.enabled = false\n' alsa_monitor v4l2_monitor libcamera_monitor \
     >"$directory/config/wireplumber/main.lua.d/60-no-hardware.lua"

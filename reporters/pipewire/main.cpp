@@ -1,0 +1,90 @@
+#include <chrono>
+#include <cstdio>
+#include <exception>
+#include <string>
+
+#include <CLI/CLI.hpp>
+#include <fmt/format.h>
+
+#include "client/HalvoxClient.h"
+#include "reporters/pipewire/HalvoxReportingClient.h"
+#include "reporters/pipewire/MainLoop.h"
+#include "reporters/pipewire/PipeWireSource.h"
+#include "reporters/pipewire/StreamTracker.h"
+#include "reporters/pipewire/VerboseReportingClient.h"
+
+namespace {
+
+using namespace halvox::pipewire_reporter;  // NOLINT(google-build-using-namespace): the program's
+
+constexpr int kExitUsage = 2;
+constexpr int kExitSoftware = 70;
+constexpr std::chrono::seconds kFarewell{1};
+
+struct Arguments {
+  std::string socket;
+  std::string remote;
+  bool verbose = false;
+};
+
+void logLine(std::string_view line) { fmt::print(stderr, "halvox-pipewire-reporter: {}\n", line); }
+
+void declareOptions(CLI::App& app, Arguments& arguments) {
+  app.add_option("--socket", arguments.socket, "The reporting service's socket")->type_name("PATH");
+  app.add_option("--remote", arguments.remote, "The PipeWire server to follow")->type_name("NAME");
+  app.add_flag("--verbose", arguments.verbose, "Say each operation and message on standard error");
+  app.set_version_flag("--version", std::string("halvox-pipewire-reporter " HALVOX_VERSION));
+}
+
+void logLosses(const halvox::client::Counters& counters, const StreamTracker& tracker) {
+  if (counters.dropped + counters.lost + counters.refused > 0) {
+    logLine(fmt::format("messages dropped {}, lost {}, refused {} of {}", counters.dropped,
+                        counters.lost, counters.refused, counters.accepted + counters.dropped));
+  }
+  if (tracker.refusedStreams() > 0) {
+    logLine(fmt::format("streams left alone: {}", tracker.refusedStreams()));
+  }
+}
+
+void run(const Arguments& arguments) {
+  MainLoop loop;
+  halvox::client::HalvoxClient client({.socketPath = arguments.socket});
+  HalvoxReportingClient handOver(client);
+  VerboseReportingClient verbose(handOver, logLine);
+  StreamTracker tracker(arguments.verbose ? static_cast<ReportingClient&>(verbose) : handOver);
+  auto serviceRestarted = loop.makeNotifier([&tracker] { tracker.serviceRestarted(); });
+  client.setConnectionHandler([serviceRestarted, wasLost = false](bool connected) mutable {
+    logLine(connected ? "connected to the reporting service" : "the reporting service has gone");
+    if (connected && wasLost) {
+      serviceRestarted();
+    }
+    wasLost = wasLost || !connected;
+  });
+  {
+    const PipeWireSource source(loop.handle(), tracker,
+                                {.remote = arguments.remote, .log = logLine});
+    loop.run();
+  }
+  client.flush(kFarewell);
+  logLosses(client.counters(), tracker);
+}
+
+}  // namespace
+
+int main(int count, char** texts) {
+  CLI::App app(
+      "Gives each audio stream of a running PipeWire a reporting session.\n"
+      "Runs until SIGTERM or SIGINT; then its sessions are stopped and destroyed.");
+  Arguments arguments;
+  declareOptions(app, arguments);
+  try {
+    app.parse(count, texts);
+    run(arguments);
+    return 0;
+  } catch (const CLI::ParseError& error) {
+    return app.exit(error) == 0 ? 0 : kExitUsage;
+  } catch (const std::exception& error) {
+    logLine(error.what());
+    return kExitSoftware;
+  }
+}
