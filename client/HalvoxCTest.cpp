@@ -1,0 +1,62 @@
+#include <array>
+#include <string>
+
+#include <gtest/gtest.h>
+#include <spawn.h>
+#include <sys/wait.h>
+
+#include "client/TestService.h"
+
+namespace halvox::client {
+namespace {
+
+using platform::Array;
+using platform::Data;
+using platform::Date;
+
+// Runs the program that is written in C against this service; its exit status.
+int runCProgram(std::string socketPath) {
+  std::string program = HALVOX_C_TEST_PROGRAM;
+  const std::array<char*, 3> arguments{program.data(), socketPath.data(), nullptr};
+  pid_t pid = 0;
+  if (posix_spawn(&pid, program.c_str(), nullptr, nullptr, arguments.data(), environ) != 0) {
+    return -1;
+  }
+  int status = 0;
+  waitpid(pid, &status, 0);
+  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+}
+
+Value bytes(std::string_view text) { return Data(std::as_bytes(std::span(text))); }
+
+TEST(HalvoxCTest, ACProgramReportsThroughTheSharedLibrary) {
+  const ScratchDirectory scratch;
+  TestService service(scratch.path("reporting.sock"));
+
+  ASSERT_EQ(runCProgram(scratch.path("reporting.sock")), 0);
+
+  const Dictionary expected{
+      {"int64", -5},
+      {"uint64", 5},
+      {"double", 2.25},
+      {"bool", false},
+      {"string", "\xC3\xA4"},
+      {"data", bytes("xyz")},
+      {"date", Date{1e9}},
+      {"dictionary", Dictionary{{"inside", 1}}},
+      {"array", Array{INT64_MIN, UINT64_MAX, 0.5, true, "text",
+                      bytes(std::string_view("\0\xff", 2)), Date{1.5}, Dictionary{}, Array{}}},
+  };
+  EXPECT_EQ(service.members(),
+            "createReportingSession setServiceType setConfiguration startReportingSessionForID "
+            "sendMessage sendMessage sendMessage stopReportingSessionForID "
+            "destroyReportingSession reporterIDValid");
+  const auto calls = service.calls();
+  EXPECT_EQ(calls.at(2).arguments.front(), Value(expected));
+  EXPECT_EQ(calls.at(4).arguments, (std::vector<Value>{expected, 4, 1, Array{Array{7}}}));
+  EXPECT_EQ(calls.at(5).arguments, (std::vector<Value>{expected, 4, 2, Array{Array{7, 8}}}));
+  EXPECT_EQ(calls.at(6).arguments, (std::vector<Value>{expected, 14, 18, Array{}}));
+}
+
+}  // namespace
+}  // namespace halvox::client
