@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <atomic>
 #include <chrono>
 #include <functional>
@@ -35,8 +36,7 @@ class DispatchContract : public ::testing::Test {
     return harness_.letRunUntil([&done] { return done->load(); });
   }
 
-  static constexpr QueueThreading kThreadings[] = {QueueThreading::kOwnThread,
-                                                   QueueThreading::kShared};
+  static constexpr std::array kThreadings{QueueThreading::kOwnThread, QueueThreading::kShared};
   Harness harness_;
 };
 TYPED_TEST_SUITE_P(DispatchContract);
