@@ -1,0 +1,109 @@
+"""A private PipeWire with WirePlumber and a null sink, and the reporter that follows it."""
+
+import itertools
+import math
+import os
+import shutil
+import struct
+import subprocess
+import tempfile
+import wave
+from pathlib import Path
+
+from harness import BIN, stop_process, wait_for
+
+REPORTER = BIN / "halvox-pipewire-reporter"
+PRIVATE_PIPEWIRE = Path(__file__).resolve().parents[2] / "scripts/lib/private-pipewire.sh"
+
+
+def missing():
+    """Why real audio cannot be tested here; empty when it can."""
+    if not REPORTER.exists():
+        return f"{REPORTER} is not built"
+    check = subprocess.run([PRIVATE_PIPEWIRE, "check"], capture_output=True, text=True)
+    return check.stdout.strip()
+
+
+class Audio:
+    """The private PipeWire. Use as a context manager; children get `environment`."""
+
+    def __enter__(self):
+        self.directory = Path(tempfile.mkdtemp(prefix="halvox-audio-"))
+        self._server = subprocess.Popen(
+            [PRIVATE_PIPEWIRE, "serve", self.directory],
+            stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True)
+        try:
+            self._expect("ready")
+            lines = (self.directory / "environment").read_text().splitlines()
+            self.environment = {**os.environ, **dict(line.split("=", 1) for line in lines)}
+            for name in ("PIPEWIRE_REMOTE", "PIPEWIRE_RUNTIME_DIR"):
+                self.environment.pop(name, None)
+        except BaseException:
+            self.__exit__()
+            raise
+        return self
+
+    def __exit__(self, *_):
+        self._server.stdin.close()
+        stop_process(self._server)
+        self._server.stdout.close()
+        shutil.rmtree(self.directory, ignore_errors=True)
+
+    def restart(self):
+        self._server.stdin.write("restart\n")
+        self._server.stdin.flush()
+        self._expect("restarted")
+
+    def _expect(self, word):
+        line = self._server.stdout.readline().strip()
+        if line != word:
+            raise AssertionError(f"the private PipeWire said {line!r} instead of {word!r}")
+
+    def tone(self, seconds, rate=48000):
+        path = self.directory / f"tone-{seconds}.wav"
+        samples = (int(16000 * math.sin(2 * math.pi * 440 * i / rate)) for i in range(int(seconds * rate)))
+        with wave.open(str(path), "wb") as file:
+            file.setnchannels(1)
+            file.setsampwidth(2)
+            file.setframerate(rate)
+            file.writeframes(b"".join(struct.pack("<h", sample) for sample in samples))
+        return path
+
+    def run(self, *command):
+        return subprocess.Popen(command, env=self.environment, stdin=subprocess.DEVNULL,
+                                stdout=subprocess.DEVNULL)
+
+    def play(self, seconds, volume=0.5, role="Music"):
+        return self.run("pw-play", "--volume", str(volume), "--media-role", role, self.tone(seconds))
+
+
+class Reporter:
+    """The built reporter, between a private PipeWire and a service."""
+
+    _numbers = itertools.count()
+
+    def __init__(self, audio, service):
+        self.log_path = audio.directory / f"reporter-{next(Reporter._numbers)}.log"
+        with open(self.log_path, "ab") as log:
+            self.process = subprocess.Popen(
+                [REPORTER, "--socket", service.socket, "--verbose"],
+                env=audio.environment, stdin=subprocess.DEVNULL, stdout=log, stderr=log)
+        wait_for("the reporter to follow PipeWire", lambda: "following PipeWire" in self.log())
+
+    def __enter__(self):
+        return self
+
+    def __exit__(self, *_):
+        stop_process(self.process)
+
+    def log(self):
+        return self.log_path.read_text(errors="replace")
+
+    def voluntary_switches(self):
+        """How often its threads went to sleep so far: each is one wake-up."""
+        total = 0
+        for status in Path(f"/proc/{self.process.pid}/task").glob("*/status"):
+            for line in status.read_text().splitlines():
+                if line.startswith("voluntary_ctxt_switches:"):
+                    total += int(line.split()[1])
+        return total
