@@ -1,0 +1,105 @@
+// Hostile bytes as a message. The first byte chooses how the rest is used: as a whole frame, or as
+// the body of one with a signature from a list, in either byte order.
+
+#include <array>
+#include <cstdint>
+#include <cstdlib>
+#include <span>
+#include <string>
+#include <string_view>
+#include <variant>
+#include <vector>
+
+#include "platform/linux/connection/wire/Frame.h"
+#include "platform/linux/connection/wire/FrameWriter.h"
+#include "platform/linux/connection/wire/Utf8.h"
+#include "platform/linux/connection/wire/ValueDecoder.h"
+
+namespace halvox::platform::linux_::dbus {
+namespace {
+
+constexpr std::array<std::string_view, 15> kSignatures{
+    "a{sv}uqaax", "a{sv}", "v",  "av",     "aav", "a{sa{sv}}", "ybnqiuxtdsog", "a(d)",
+    "aay",        "as",    "qx", "a{sv}x", "aax", "a{say}",    "aaaaay"};
+
+void require(bool condition) {
+  if (!condition) std::abort();
+}
+
+// What is taken may cost this much more memory than it had bytes on the wire. The worst is a
+// dictionary of one entry, with room for four, in some 16 bytes.
+constexpr std::size_t kMaxGrowth = 24;
+
+// Everything that was decoded can be shown, and written and read again with the same result.
+void checkValues(const Frame& frame, const std::vector<Value>& arguments) {
+  std::size_t memory = 0;
+  for (const Value& argument : arguments) {
+    require(argument.kind() != ValueKind::kNone);
+    memory += argument.memorySize();
+    (void)describe(argument);
+  }
+  require(memory <= kMaxGrowth * frame.body.size());
+
+  std::string written;
+  const CallTarget target{{}, "/o", {}, "m"};
+  if (!appendMethodCall(written, 1, target, frame.header.signature, arguments)) {
+    return;  // what nests nearly to the limit can be read but not written
+  }
+  const auto again = readFrame(std::as_bytes(std::span(written)));
+  require(std::holds_alternative<Frame>(again));
+  std::vector<Value> decoded;
+  require(!decodeBody(std::get<Frame>(again), frame.header.signature, decoded).has_value());
+  require(decoded == arguments);
+}
+
+void checkError(const DecodeError& error) {
+  require(!error.message.empty() && isWireText(error.message));
+  require(error.message.find('\n') == std::string::npos);
+}
+
+void decode(const Frame& frame) {
+  std::vector<Value> arguments;
+  if (const auto error = decodeBody(frame, frame.header.signature, arguments)) {
+    checkError(*error);
+  } else {
+    checkValues(frame, arguments);
+  }
+}
+
+void readWhole(std::span<const std::byte> bytes) {
+  const auto result = readFrame(bytes);
+  if (const auto* frame = std::get_if<Frame>(&result)) {
+    require(frame->body.size() <= bytes.size());
+    decode(*frame);
+  } else {
+    require(!std::get<WireError>(result).message.empty());
+  }
+  const FrameMeasure measure = measureFrame(bytes, kMaxMessageBytes);
+  // A frame with something behind it, as a read buffer has it.
+  if (measure.state == FrameMeasure::State::kKnown && measure.totalBytes < bytes.size()) {
+    const auto first = readFrame(bytes.first(measure.totalBytes));
+    if (const auto* frame = std::get_if<Frame>(&first)) decode(*frame);
+  }
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_::dbus
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+  using namespace halvox::platform::linux_::dbus;
+  if (size == 0) return 0;
+  const std::uint8_t mode = data[0];
+  // The rest on a boundary of its own, so that sanitizers see its exact end.
+  const std::vector<std::uint8_t> rest(data + 1, data + size);
+  const auto bytes = std::as_bytes(std::span(rest));
+  if (mode % 16 == kSignatures.size()) {
+    readWhole(bytes);
+    return 0;
+  }
+  Frame frame;
+  frame.header.signature = kSignatures[mode % 16];
+  frame.header.bigEndian = mode >= 128;
+  frame.body = bytes;
+  decode(frame);
+  return 0;
+}
