@@ -24,11 +24,12 @@ import gi
 gi.require_version("Gio", "2.0")
 from gi.repository import Gio, GLib  # noqa: E402
 
-BIN = Path(os.environ.get("HALVOX_BIN", "build/dev/bin")).resolve()
+BIN = Path(os.environ.get("HALVOX_BIN", Path(__file__).parents[2] / "build/dev/bin")).resolve()
 SERVICE = BIN / "halvox-reportingd"
 CTL = BIN / "halvoxctl"
 BUS_NAME = "com.tarno.halvox.reporting"
 OBJECT = "/com/tarno/halvox/reporting"
+UPTIME_EVENT = "com.tarno.halvox.hvreportingclientuptime"
 INTERFACE = "com.tarno.halvox.HVReportingServiceProtocol"
 DEADLINE = 30.0  # seconds; generous, for sanitizer builds on a busy machine
 
@@ -157,7 +158,11 @@ class Service:
         return Client.to_socket(self.address)
 
     def events(self):
-        """All recorded events in order, as (name, payload) pairs; none before the first commit."""
+        """The recorded messages in order, as (name, payload) pairs; none before the first commit."""
+        return [event for event in self.all_events() if event[0] != UPTIME_EVENT]
+
+    def all_events(self):
+        """The same with the events that the service records when a client leaves."""
         if not self.database.exists():
             return []
         with contextlib.closing(sqlite3.connect(f"file:{self.database}?mode=ro", uri=True)) as database:
@@ -166,6 +171,11 @@ class Service:
 
     def wait_for_events(self, count):
         return wait_for(f"{count} events", lambda: len(found := self.events()) >= count and found)
+
+    def wait_for_payload(self, matches):
+        """The first recorded payload that matches, once there is one."""
+        return wait_for("a recorded payload",
+                        lambda: next((payload for _, payload in self.events() if matches(payload)), None))
 
     def memory_kib(self):
         for line in Path(f"/proc/{self.process.pid}/status").read_text().splitlines():
@@ -310,7 +320,7 @@ def to_variant(value):
     if isinstance(value, str):
         return GLib.Variant("s", value)
     if isinstance(value, bytes):
-        return GLib.Variant("ay", value)
+        return GLib.Variant.new_from_bytes(GLib.VariantType("ay"), GLib.Bytes(value), True)
     if isinstance(value, dict):
         return GLib.Variant("a{sv}", variants(value))
     if isinstance(value, (list, tuple)):

@@ -111,7 +111,7 @@ class Startup(unittest.TestCase):
 
         result = self.run_service(self.config())
 
-        self.assert_refused(result, EX_DATAERR, "halvox.db", "newer")
+        self.assert_refused(result, EX_DATAERR, "halvox.db", "version 9999")
         self.assertEqual((store / "halvox.db").read_bytes(), before)
 
     def test_damaged_database_is_set_aside_and_a_new_one_begun(self):
