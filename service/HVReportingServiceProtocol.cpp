@@ -94,9 +94,10 @@ void invokeSendMessage(ExportedObject& object, Invocation&& request) {
   // There is no null on the wire: the list comes inside another, which is empty for none.
   const Array lists = request.arguments[3].array();
   if (lists.size() > 1) {
-    request.reply(Error{.description = "reporter IDs: more than one list",
-                        .name = std::string(kInvalidArguments)},
-                  Value());
+    request.reply(
+        Error{.description = "sendMessage: argument 4: more than one list of reporter IDs",
+              .name = std::string(kInvalidArguments)},
+        Value());
     return;
   }
   HVReportingServiceProtocol::ReporterIDs reporters;
@@ -142,7 +143,7 @@ constexpr MethodEffect kMore = MethodEffect::kMayHoldMore;
 constexpr MethodEffect kNoMore = MethodEffect::kHoldsNoMore;
 
 constexpr std::array kMethods{
-    InterfaceMethod{"createReportingSession", "x", "b", kMore, invokeCreate},
+    InterfaceMethod{"createReportingSession", "x", "b", MethodEffect::kMakesSession, invokeCreate},
     InterfaceMethod{"setServiceType", "qx", "b", kNoMore, invokeSetServiceType},
     InterfaceMethod{"getServiceNameForReporterID", "x", "q", kNoMore, invokeGetServiceName},
     InterfaceMethod{"setConfiguration", "a{sv}x", "b", kMore, invokeSetConfiguration},

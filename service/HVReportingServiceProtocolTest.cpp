@@ -28,7 +28,7 @@ TEST(HVReportingServiceInterfaceTest, HasTheNamesThatClientsUse) {
 }
 
 TEST(HVReportingServiceInterfaceTest, ListsTheMethodsWithTheirSignatures) {
-  const std::vector<Row> expected{{"createReportingSession", "x", "b", kMore},
+  const std::vector<Row> expected{{"createReportingSession", "x", "b", MethodEffect::kMakesSession},
                                   {"setServiceType", "qx", "b", kNoMore},
                                   {"getServiceNameForReporterID", "x", "q", kNoMore},
                                   {"setConfiguration", "a{sv}x", "b", kMore},
@@ -89,7 +89,8 @@ TEST_F(HVReportingServiceProtocolTest, MoreThanOneListOfReporterIDsIsRefused) {
   ASSERT_EQ(call->replies().size(), 1U);
   ASSERT_TRUE(call->replies()[0].error.has_value());
   EXPECT_EQ(call->replies()[0].error->name, "org.freedesktop.DBus.Error.InvalidArgs");
-  EXPECT_EQ(call->replies()[0].error->description, "reporter IDs: more than one list");
+  EXPECT_EQ(call->replies()[0].error->description,
+            "sendMessage: argument 4: more than one list of reporter IDs");
   EXPECT_EQ(platform_.dispatch.waitingJobs(), 0U);
 }
 

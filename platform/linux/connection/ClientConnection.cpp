@@ -203,7 +203,9 @@ void ClientConnection::sendReturn(std::uint32_t serial, std::string_view signatu
 }
 
 void ClientConnection::sendServiceError(std::uint32_t serial, const Error& error) {
-  sendError(serial, error.domain + ".Code" + std::to_string(error.code), error.description);
+  const std::string name =
+      error.name.empty() ? error.domain + ".Code" + std::to_string(error.code) : error.name;
+  sendError(serial, name, error.description);
 }
 
 void ClientConnection::sendError(std::uint32_t serial, std::string_view name,
