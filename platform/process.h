@@ -11,7 +11,8 @@ using ProcessID = std::int32_t;
 // What the platform knows of a running process.
 struct ProcessRecord {
   ProcessID pid = 0;
-  std::string commandName;  // at most 15 bytes; bytes that are not UTF-8 are replaced
+  // At most 15 bytes as the kernel has it; each byte that is not UTF-8 is replaced by U+FFFD.
+  std::string commandName;
 };
 
 // Look-ups of processes. Any thread may ask; an answer reads a small file and does not wait.

@@ -1,10 +1,13 @@
 #include "platform/fake/FakeProcessService.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace halvox::platform {
 
 void FakeProcessService::addProcess(ProcessID pid, std::string commandName) {
+  constexpr std::size_t kLongestName = 15;  // as the port promises
+  commandName.resize(std::min(commandName.size(), kLongestName));
   const std::lock_guard lock(mutex_);
   names_.insert_or_assign(pid, std::move(commandName));
 }
