@@ -1,5 +1,6 @@
 #include "platform/linux/store/Retention.h"
 
+#include <algorithm>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -12,7 +13,7 @@ constexpr std::chrono::minutes kAgeInterval{1};
 // the fastest writing.
 constexpr int kAgeSteps = 16;
 constexpr int kSizeSteps = 128;
-constexpr std::string_view kVacuumPages = "256";
+constexpr std::uint64_t kLeastPage = 512;  // that SQLite knows
 
 SqliteCode readInteger(Statement& statement, std::uint64_t& value) {
   const SqliteCode code = statement.step();
@@ -38,14 +39,18 @@ SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
 
 SqliteCode Retention::prepare(Database& database) {
   pageBytes_ = static_cast<std::uint64_t>(database.queryInteger("PRAGMA page_size").value_or(0));
-  const std::string vacuum = "PRAGMA incremental_vacuum(" + std::string(kVacuumPages) + ")";
+  // Each page that is moved is written to the log, so few at a time.
+  const std::uint64_t vacuumPages =
+      limits_.transactionBytes / (2 * std::max(pageBytes_, kLeastPage));
+  const std::string vacuum = "PRAGMA incremental_vacuum(" + std::to_string(vacuumPages) + ")";
   for (const auto& [statement, sql] :
        {std::pair<Statement*, std::string_view>{&statements_.begin, "BEGIN IMMEDIATE"},
         {&statements_.commit, "COMMIT"},
         {&statements_.rollback, "ROLLBACK"},
         {&statements_.pages, "PRAGMA page_count"},
         {&statements_.freePages, "PRAGMA freelist_count"},
-        {&statements_.vacuum, vacuum}}) {
+        {&statements_.vacuum, vacuum},
+        {&statements_.checkpoint, "PRAGMA wal_checkpoint(PASSIVE)"}}) {
     const SqliteCode code = database.prepare(sql, *statement);
     if (code != SQLITE_OK) return code;
   }
@@ -61,14 +66,20 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
   if (code != SQLITE_OK) return code;
   if (!byAge && !isFull() && fileBytes() <= limits_.databaseBytes) return SQLITE_OK;
 
+  const std::uint64_t before = fileBytes();
   code = statements_.begin.run();
   if (code != SQLITE_OK) return code;
   if (byAge) code = deleteAged(now, kinds, more);
   if (code == SQLITE_OK) code = deleteForSize(kinds, more);
   if (code == SQLITE_OK) code = shrinkFile(more);
   if (code == SQLITE_OK) code = statements_.commit.run();
-  if (code != SQLITE_OK) static_cast<void>(statements_.rollback.run());
-  return code;
+  if (code != SQLITE_OK) {
+    static_cast<void>(statements_.rollback.run());
+    return code;
+  }
+  // The file itself shrinks when the log is copied into it.
+  const bool hasShrunk = fileBytes() < before;
+  return hasShrunk && !more ? statements_.checkpoint.run() : SQLITE_OK;
 }
 
 bool Retention::isFull() const {

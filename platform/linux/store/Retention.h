@@ -48,6 +48,7 @@ class Retention {
     Statement pages;
     Statement freePages;
     Statement vacuum;
+    Statement checkpoint;
   } statements_;
   std::uint64_t pageBytes_ = 0;
   std::uint64_t pages_ = 0;

@@ -44,6 +44,7 @@ class Statement {
     return sqlite3_column_double(handle_.get(), column);
   }
   [[nodiscard]] std::string_view text(int column) const;
+  [[nodiscard]] int columns() const { return sqlite3_column_count(handle_.get()); }
 
  private:
   friend class Database;

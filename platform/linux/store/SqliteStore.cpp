@@ -65,14 +65,14 @@ void SqliteStore::close() {
 
 void SqliteStore::run() {
   pthread_setname_np(pthread_self(), "halvox-store");
-  maintain();
+  maintainWhileIdle();
   const auto takeAll = [this] {
     for (RecordKind* const kind : kinds_) kind->takeQueued();
   };
   while (queue_.take(nextRound_, takeAll)) {
     nextRound_ = std::chrono::steady_clock::now() + queue_.limits().gatherTime;
     writeTaken();
-    maintain();
+    maintainWhileIdle();
   }
   closeDatabase();
 }
@@ -83,6 +83,7 @@ void SqliteStore::writeTaken() {
     const SqliteCode code = writeTransaction();
     if (code != SQLITE_OK) return fail(code, "events were not stored");
     onStored();
+    static_cast<void>(maintainOnce());
   }
 }
 
@@ -127,6 +128,7 @@ SqliteCode SqliteStore::prepareStatements() {
 SqliteCode SqliteStore::writeTransaction() {
   TransactionAllowance allowance{kRecordsPerTransaction,
                                  static_cast<std::int64_t>(sizes_.transactionBytes)};
+  errno = 0;
   SqliteCode code = begin_.run();
   for (RecordKind* const kind : kinds_) {
     if (code == SQLITE_OK) code = kind->write(allowance);
@@ -142,8 +144,11 @@ void SqliteStore::onStored() {
 }
 
 void SqliteStore::fail(SqliteCode code, std::string_view what) {
-  // Before anything else, because every call of the library replaces its last error.
-  const DropReason reason = reasonOf(code, database_.systemError());
+  // Before anything else, because every call replaces the last error. For a failed commit the
+  // library does not say what the system said; then it is the last that the system said at all.
+  const int lastError = errno;
+  const int systemError = database_.systemError() != 0 ? database_.systemError() : lastError;
+  const DropReason reason = reasonOf(code, systemError);
   const std::string description =
       files_.database().native() + ": " + std::string(what) + ": " + database_.errorText();
   if (sqlite3_get_autocommit(database_.get()) == 0) {
@@ -169,16 +174,20 @@ void SqliteStore::drop(DropReason reason, std::string_view what) {
   kLog.error("", what, "; ", droppedSinceStored_, " events dropped since the last were stored");
 }
 
-// One step after each round, however busy; as many as are due when nothing waits.
-void SqliteStore::maintain() {
-  if (!database_.isOpen()) return;
-  bool more = true;
-  while (more) {
-    const double now = clock_.currentDate().secondsSince1970;
-    const SqliteCode code = retention_.runOnce(now, kinds_, more);
-    if (code != SQLITE_OK) return fail(code, "old events were not deleted");
-    if (queue_.hasQueued()) return;
+void SqliteStore::maintainWhileIdle() {
+  while (!queue_.hasQueued() && maintainOnce()) {
   }
+}
+
+// Deletes a little of what is due; true when there is more.
+bool SqliteStore::maintainOnce() {
+  if (!database_.isOpen()) return false;
+  bool more = false;
+  const double now = clock_.currentDate().secondsSince1970;
+  const SqliteCode code = retention_.runOnce(now, kinds_, more);
+  if (code == SQLITE_OK) return more;
+  fail(code, "old events were not deleted");
+  return false;
 }
 
 void SqliteStore::closeDatabase() {

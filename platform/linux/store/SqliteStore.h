@@ -83,7 +83,8 @@ class SqliteStore {
   void fail(SqliteCode code, std::string_view what);
   void drop(DropReason reason, std::string_view what);
   void onStored();
-  void maintain();
+  void maintainWhileIdle();
+  [[nodiscard]] bool maintainOnce();
   void closeDatabase();
   void abandonDatabase();
 

@@ -70,6 +70,7 @@ SqliteCode check(Database& database, std::string& finding) {
   SqliteCode code = database.prepare("PRAGMA quick_check(1)", statement);
   if (code == SQLITE_OK) code = statement.step();
   if (code == SQLITE_ROW) finding = statement.text(0);
+  std::ranges::replace(finding, '\n', ' ');
   sqlite3_progress_handler(database.get(), 0, nullptr, nullptr);
   if (code == SQLITE_INTERRUPT) return SQLITE_OK;
   if (code != SQLITE_ROW) return code;

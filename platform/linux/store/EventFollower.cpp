@@ -1,0 +1,128 @@
+#include "platform/linux/store/EventFollower.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstdint>
+#include <string_view>
+#include <system_error>
+
+#include <sys/epoll.h>
+#include <sys/inotify.h>
+#include <sys/timerfd.h>
+
+#include "platform/linux/store/StoreSchema.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// The log is written a moment before the commit in it shows, and only the writing is announced: so
+// the follower looks again so many times, so far apart.
+constexpr int kLooksAgain = 3;
+constexpr long kLookAgainNanoseconds = 25'000'000;
+
+constexpr std::uint32_t kWatched =
+    IN_MODIFY | IN_CREATE | IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR;
+
+StoreError systemFailure(const std::filesystem::path& directory) {
+  const auto kind = errno == ENOENT || errno == ENOTDIR ? StoreError::Kind::kMissing
+                                                        : StoreError::Kind::kCannotOpen;
+  return {kind, directory.native() +
+                    ": the directory cannot be watched: " + std::system_category().message(errno)};
+}
+
+// The shared memory beside the database is left out: reading changes it too.
+bool isStoreFile(std::string_view name) {
+  return name.starts_with(kStoreFileName) && !name.ends_with("-shm");
+}
+
+}  // namespace
+
+std::optional<StoreError> EventFollower::open(const std::filesystem::path& directory,
+                                              const EventFilter& filter) {
+  directory_ = directory;
+  filter_ = filter;
+  started_ = false;
+  poller_.reset(::epoll_create1(EPOLL_CLOEXEC));
+  timer_.reset(::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC));
+  watch_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
+  if (!poller_ || !timer_ || !watch_) return systemFailure(directory);
+  // Before anything is read, so that no event falls between reading and watching.
+  if (::inotify_add_watch(watch_.get(), directory.c_str(), kWatched) < 0) {
+    return systemFailure(directory);
+  }
+  for (const int source : {watch_.get(), timer_.get()}) {
+    epoll_event interest{};
+    interest.events = EPOLLIN;
+    if (::epoll_ctl(poller_.get(), EPOLL_CTL_ADD, source, &interest) != 0) {
+      return systemFailure(directory);
+    }
+  }
+  return reader_.open(directory);
+}
+
+std::optional<StoreError> EventFollower::deliver(const StoreReader::EventCallback& callback) {
+  const Change change = readChanges();
+  if (change == Change::kDirectoryGone) {
+    return StoreError{StoreError::Kind::kMissing,
+                      directory_.native() + ": the directory was removed"};
+  }
+  const bool timerRan = readTimer();
+  if (change == Change::kStoreWritten) looksLeft_ = kLooksAgain;
+  if (change == Change::kNone && !timerRan && started_) return std::nullopt;
+  if (looksLeft_ > 0) startTimer();
+  bool isOpen = true;
+  if (reader_.isReplaced()) {
+    if (auto error = reopen(isOpen)) return error;
+  }
+  if (!isOpen) return std::nullopt;
+  started_ = true;
+  auto error = reader_.forEachEvent(filter_, [&](const StoredEvent& event) {
+    filter_.after = std::max(filter_.after, event.id);
+    callback(event);
+  });
+  filter_.newest.reset();
+  return error;
+}
+
+// The database was replaced: its numbers begin anew. Until there is another, nothing is open.
+std::optional<StoreError> EventFollower::reopen(bool& isOpen) {
+  auto error = reader_.open(directory_);
+  isOpen = !error.has_value();
+  if (isOpen) filter_.after = 0;
+  if (error.has_value() && error->kind == StoreError::Kind::kMissing) return std::nullopt;
+  return error;
+}
+
+EventFollower::Change EventFollower::readChanges() {
+  Change change = Change::kNone;
+  alignas(inotify_event) std::array<char, 4096> buffer;
+  while (true) {
+    const ssize_t length = ::read(watch_.get(), buffer.data(), buffer.size());
+    if (length <= 0) return change;
+    for (std::size_t at = 0; at < static_cast<std::size_t>(length);) {
+      const auto* event = reinterpret_cast<const inotify_event*>(&buffer[at]);
+      at += sizeof *event + event->len;
+      if ((event->mask & (IN_DELETE_SELF | IN_MOVE_SELF | IN_IGNORED)) != 0) {
+        return Change::kDirectoryGone;
+      }
+      const bool overflow = (event->mask & IN_Q_OVERFLOW) != 0;
+      if (overflow || (event->len > 0 && isStoreFile(event->name))) change = Change::kStoreWritten;
+    }
+  }
+}
+
+bool EventFollower::readTimer() {
+  std::uint64_t expirations = 0;
+  if (::read(timer_.get(), &expirations, sizeof expirations) != sizeof expirations) return false;
+  looksLeft_ = std::max(0, looksLeft_ - 1);
+  return true;
+}
+
+void EventFollower::startTimer() {
+  itimerspec delay{};
+  delay.it_value.tv_nsec = kLookAgainNanoseconds;
+  ::timerfd_settime(timer_.get(), 0, &delay, nullptr);
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,116 @@
+#include "platform/linux/store/EventFollower.h"
+
+#include <string>
+#include <vector>
+
+#include <poll.h>
+
+#include "platform/linux/store/StoreTestSupport.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+class EventFollowerTest : public StoreTest {
+ protected:
+  // Delivers until so many were seen in all; false after ten seconds.
+  bool follow(std::size_t count) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+    while (std::chrono::steady_clock::now() < deadline) {
+      const auto error =
+          follower.deliver([this](const StoredEvent& event) { seen.emplace_back(event.payload); });
+      EXPECT_FALSE(error.has_value()) << error->description;
+      if (error.has_value() || seen.size() >= count) return !error.has_value();
+      pollfd waiting{follower.descriptor(), POLLIN, 0};
+      ::poll(&waiting, 1, 1000);
+    }
+    return false;
+  }
+
+  EventFollower follower;
+  std::vector<std::string> seen;
+};
+
+TEST_F(EventFollowerTest, BeginsWithWhatIsStoredAndGoesOnWithWhatComes) {
+  start();
+  for (std::int64_t number = 0; number < 5; ++number) send(number);
+  ASSERT_TRUE(allIsStored());
+  ASSERT_EQ(follower.open(options.directory, {.newest = 1}), std::nullopt);
+  ASSERT_TRUE(follow(1));
+  send(5);
+  ASSERT_TRUE(follow(2));
+  send(6);
+  ASSERT_TRUE(follow(3));
+  EXPECT_THAT(seen, ElementsAre(numbered(4), numbered(5), numbered(6)));
+}
+
+TEST_F(EventFollowerTest, LosesAndRepeatsNothingUnderLoad) {
+  constexpr std::size_t kEvents = 20'000;
+  start();
+  ASSERT_EQ(follower.open(options.directory, {}), std::nullopt);
+  for (std::size_t number = 0; number < kEvents; ++number) {
+    send(static_cast<std::int64_t>(number));
+    if (number % 1000 == 0) {
+      ASSERT_TRUE(follow(0));
+    }
+  }
+  ASSERT_TRUE(follow(kEvents));
+  ASSERT_EQ(seen.size(), kEvents);
+  for (std::size_t number = 0; number < kEvents; ++number) {
+    ASSERT_EQ(seen[number], numbered(static_cast<std::int64_t>(number)));
+  }
+}
+
+TEST_F(EventFollowerTest, AppliesItsFilterToWhatComes) {
+  start();
+  ASSERT_EQ(follower.open(options.directory, {.name = "wanted"}), std::nullopt);
+  send(1, "other");
+  send(2, "wanted");
+  ASSERT_TRUE(follow(1));
+  EXPECT_THAT(seen, ElementsAre(numbered(2)));
+}
+
+TEST_F(EventFollowerTest, GoesOnAfterTheServiceWasStartedAnew) {
+  start();
+  ASSERT_EQ(follower.open(options.directory, {}), std::nullopt);
+  send(1);
+  ASSERT_TRUE(follow(1));
+  start();
+  send(2);
+  ASSERT_TRUE(follow(2));
+  EXPECT_THAT(seen, ElementsAre(numbered(1), numbered(2)));
+}
+
+TEST_F(EventFollowerTest, GoesOnWithADatabaseThatTookThePlaceOfTheOld) {
+  start();
+  ASSERT_EQ(follower.open(options.directory, {}), std::nullopt);
+  send(1);
+  ASSERT_TRUE(follow(1));
+  for (const char* suffix : {"", "-wal", "-shm"}) {
+    std::filesystem::remove(database().native() + suffix);
+  }
+  send(2);
+  ASSERT_TRUE(follow(2));
+  EXPECT_THAT(seen, ElementsAre(numbered(1), numbered(2)));
+}
+
+TEST_F(EventFollowerTest, IsQuietWhileNothingIsWritten) {
+  start();
+  send(1);
+  ASSERT_TRUE(allIsStored());
+  ASSERT_EQ(follower.open(options.directory, {}), std::nullopt);
+  ASSERT_TRUE(follow(1));
+  pollfd waiting{follower.descriptor(), POLLIN, 0};
+  EXPECT_EQ(::poll(&waiting, 1, 300), 0);
+}
+
+TEST_F(EventFollowerTest, SaysThatThereIsNothingToFollow) {
+  const auto error = follower.open(options.directory, {});
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->kind, StoreError::Kind::kMissing);
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,173 @@
+#include "platform/linux/store/PayloadEncoder.h"
+
+#include <array>
+#include <cmath>
+#include <cstdint>
+#include <limits>
+#include <span>
+#include <string>
+#include <string_view>
+
+#include <gtest/gtest.h>
+#include <rapidjson/document.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+std::string encodeOne(const Value& value) {
+  PayloadEncoder encoder;
+  return std::string(encoder.encode(Dictionary{{"k", value}}));
+}
+
+Data bytes(std::string_view text) {
+  return Data(std::as_bytes(std::span(text.data(), text.size())));
+}
+
+bool parses(std::string_view text) {
+  rapidjson::Document document;
+  document.Parse<rapidjson::kParseValidateEncodingFlag>(text.data(), text.size());
+  return !document.HasParseError() && document.IsObject();
+}
+
+TEST(PayloadEncoderTest, WritesBooleansAsBooleans) {
+  EXPECT_EQ(encodeOne(true), R"({"k":true})");
+  EXPECT_EQ(encodeOne(false), R"({"k":false})");
+}
+
+TEST(PayloadEncoderTest, WritesIntegersToTheirEnds) {
+  EXPECT_EQ(encodeOne(std::numeric_limits<std::int64_t>::min()), R"({"k":-9223372036854775808})");
+  EXPECT_EQ(encodeOne(std::numeric_limits<std::uint64_t>::max()), R"({"k":18446744073709551615})");
+  EXPECT_EQ(encodeOne(std::int16_t{-7}), R"({"k":-7})");
+  EXPECT_EQ(encodeOne(std::uint8_t{255}), R"({"k":255})");
+}
+
+TEST(PayloadEncoderTest, WritesRealsInTheirShortestForm) {
+  EXPECT_EQ(encodeOne(0.1), R"({"k":0.1})");
+  EXPECT_EQ(encodeOne(0.1F), R"({"k":0.1})");
+  EXPECT_EQ(encodeOne(1.0), R"({"k":1})");
+  EXPECT_EQ(encodeOne(-0.0), R"({"k":-0})");
+  EXPECT_EQ(encodeOne(1e300), R"({"k":1e+300})");
+  EXPECT_EQ(encodeOne(1'700'000'000.25), R"({"k":1700000000.25})");
+}
+
+TEST(PayloadEncoderTest, WritesNumbersThatJSONCannotHoldAsTexts) {
+  EXPECT_EQ(encodeOne(std::numeric_limits<double>::quiet_NaN()), R"({"k":"NaN"})");
+  EXPECT_EQ(encodeOne(std::numeric_limits<double>::infinity()), R"({"k":"Infinity"})");
+  EXPECT_EQ(encodeOne(-std::numeric_limits<float>::infinity()), R"({"k":"-Infinity"})");
+}
+
+TEST(PayloadEncoderTest, WritesDatesInUTCWithAFraction) {
+  EXPECT_EQ(encodeOne(Date{0}), R"({"k":"1970-01-01T00:00:00.000000Z"})");
+  EXPECT_EQ(encodeOne(Date{1'700'000'000.25}), R"({"k":"2023-11-14T22:13:20.250000Z"})");
+  EXPECT_EQ(encodeOne(Date{-0.5}), R"({"k":"1969-12-31T23:59:59.500000Z"})");
+  EXPECT_EQ(encodeOne(Date{0.9999999}), R"({"k":"1970-01-01T00:00:01.000000Z"})");
+}
+
+TEST(PayloadEncoderTest, WritesTheFirstAndTheLastYearOfTheDateForm) {
+  EXPECT_EQ(encodeOne(Date{-62135596800.0}), R"({"k":"0001-01-01T00:00:00.000000Z"})");
+  EXPECT_EQ(encodeOne(Date{253402300799.5}), R"({"k":"9999-12-31T23:59:59.500000Z"})");
+  const double justBeforeTheEnd = std::nextafter(253402300800.0, 0.0);
+  EXPECT_TRUE(encodeOne(Date{justBeforeTheEnd}).starts_with(R"({"k":"9999-12-31T23:59:59.)"));
+}
+
+TEST(PayloadEncoderTest, WritesDatesWithoutADateFormAsSeconds) {
+  EXPECT_EQ(encodeOne(Date{1e15}), R"({"k":1e+15})");
+  EXPECT_EQ(encodeOne(Date{std::numeric_limits<double>::quiet_NaN()}), R"({"k":"NaN"})");
+}
+
+TEST(PayloadEncoderTest, WritesDataAsBase64) {
+  EXPECT_EQ(encodeOne(bytes("")), R"({"k":""})");
+  EXPECT_EQ(encodeOne(bytes("f")), R"({"k":"Zg=="})");
+  EXPECT_EQ(encodeOne(bytes("fo")), R"({"k":"Zm8="})");
+  EXPECT_EQ(encodeOne(bytes("foobar")), R"({"k":"Zm9vYmFy"})");
+  EXPECT_EQ(encodeOne(bytes("\xFF\xFE\xFB")), R"({"k":"//77"})");
+}
+
+TEST(PayloadEncoderTest, WritesContainersAndNoValue) {
+  const Value nested = Dictionary{{"list", Array{1, "two", Array{}, Value()}}};
+  EXPECT_EQ(encodeOne(nested), R"({"k":{"list":[1,"two",[],null]}})");
+  EXPECT_EQ(PayloadEncoder().encode({}), "{}");
+}
+
+TEST(PayloadEncoderTest, EscapesWhatEndsOrBreaksAText) {
+  EXPECT_EQ(encodeOne("a\"b\\c"), R"({"k":"a\"b\\c"})");
+  EXPECT_EQ(encodeOne(std::string("a\0b\n\x1F", 5)), R"({"k":"a\u0000b\n\u001F"})");
+}
+
+TEST(PayloadEncoderTest, FindsWhatNeedsEscapingAtEveryPlaceOfAText) {
+  for (const char special : {'"', '\\', '\n', '\0', '\x1F', '\xFF'}) {
+    for (std::size_t length = 1; length <= 20; ++length) {
+      for (std::size_t place = 0; place < length; ++place) {
+        std::string text(length, 'x');
+        text[place] = special;
+        EXPECT_TRUE(parses(encodeOne(text))) << int{special} << " at " << place << "/" << length;
+      }
+    }
+  }
+}
+
+TEST(PayloadEncoderTest, LeavesPlainTextsAsTheyAre) {
+  for (char plain = ' '; plain < '\x7F'; ++plain) {
+    if (plain == '"' || plain == '\\') continue;
+    const std::string text(9, plain);
+    EXPECT_EQ(encodeOne(text), "{\"k\":\"" + text + "\"}");
+  }
+}
+
+TEST(PayloadEncoderTest, KeepsWellFormedUTF8) {
+  EXPECT_EQ(encodeOne("Grüße €, 𝄞"), "{\"k\":\"Grüße €, 𝄞\"}");
+}
+
+TEST(PayloadEncoderTest, ReplacesWhatIsNotUTF8) {
+  constexpr std::array<std::string_view, 8> kHostile{
+      "\x80", "\xC0\xAF", "\xE0\x80\x80", "\xED\xA0\x80", "\xF4\x90\x80\x80",
+      "\xC3", "\xF0\x9F", "\xFF\xFE"};
+  for (const std::string_view text : kHostile) {
+    const std::string encoded = encodeOne(text);
+    EXPECT_TRUE(parses(encoded)) << encoded;
+    EXPECT_NE(encoded.find("\xEF\xBF\xBD"), std::string::npos) << encoded;
+  }
+}
+
+TEST(PayloadEncoderTest, EscapesKeysToo) {
+  PayloadEncoder encoder;
+  EXPECT_EQ(encoder.encode(Dictionary{{"a\"\n", 1}}), R"({"a\"\n":1})");
+  EXPECT_TRUE(parses(encoder.encode(Dictionary{{"\xFF", 1}})));
+}
+
+TEST(PayloadEncoderTest, EncodesAgainAfterAVeryLargeText) {
+  PayloadEncoder encoder;
+  const std::string large(3'000'000, 'x');
+  EXPECT_EQ(encoder.encode(Dictionary{{"k", large}}).size(), large.size() + 8);
+  EXPECT_EQ(encoder.encode(Dictionary{{"k", 1}}), R"({"k":1})");
+}
+
+TEST(PayloadEncoderTest, EncodesDeepNesting) {
+  Value value = 1;
+  for (int level = 0; level < 200; ++level) value = Array{value};
+  EXPECT_TRUE(parses(encodeOne(value)));
+}
+
+TEST(PayloadEncoderTest, FindsEqualPayloadsAlike) {
+  const auto make = [] {
+    return Dictionary{{"a", 1}, {"b", "text"}, {"c", Array{1.5, Date{2}}}, {"d", Dictionary{}}};
+  };
+  EXPECT_TRUE(encodeAlike(make(), make()));
+}
+
+TEST(PayloadEncoderTest, DoesNotFindAlikeWhatIsEqualButReadsDifferently) {
+  EXPECT_FALSE(encodeAlike({{"k", 1}}, {{"k", true}}));
+  EXPECT_FALSE(encodeAlike({{"k", 0.0}}, {{"k", -0.0}}));
+  EXPECT_FALSE(encodeAlike({{"k", Array{1}}}, {{"k", Array{true}}}));
+  EXPECT_FALSE(encodeAlike({{"a", 1}, {"b", 2}}, {{"b", 2}, {"a", 1}}));
+}
+
+TEST(PayloadEncoderTest, DoesNotFindDifferentPayloadsAlike) {
+  EXPECT_FALSE(encodeAlike({{"k", 1}}, {{"k", 2}}));
+  EXPECT_FALSE(encodeAlike({{"k", 1}}, {{"l", 1}}));
+  EXPECT_FALSE(encodeAlike({{"k", 1}}, {{"k", 1}, {"l", 1}}));
+  EXPECT_FALSE(encodeAlike({{"k", bytes("a")}}, {{"k", bytes("b")}}));
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,192 @@
+#include <csignal>
+#include <string>
+
+#include <sys/resource.h>
+
+#include "platform/linux/store/StoreTestSupport.h"
+
+// How the store bears what happens to its file while it runs.
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using ::testing::Contains;
+using ::testing::ElementsAre;
+using ::testing::Ge;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::Not;
+using ::testing::SizeIs;
+
+class SqliteStoreFailureTest : public StoreTest {
+ protected:
+  // Sends events until one is stored; false after ten seconds.
+  bool storesAgain() {
+    const std::uint64_t before = counted("stored");
+    return eventually([&] {
+      send(-1);
+      return counted("stored") > before;
+    });
+  }
+  void expectBalance() {
+    EXPECT_EQ(counted("received"), counted("stored") + dropped());
+    EXPECT_THAT(payloads(), SizeIs(counted("stored")));
+  }
+};
+
+// Lets files of this process grow to so many bytes and no further, as a full disk would.
+class FileSizeLimit {
+ public:
+  explicit FileSizeLimit(rlim_t bytes) : oldAction_(std::signal(SIGXFSZ, SIG_IGN)) {
+    ::getrlimit(RLIMIT_FSIZE, &old_);
+    const rlimit limit{bytes, old_.rlim_max};
+    ::setrlimit(RLIMIT_FSIZE, &limit);
+  }
+  FileSizeLimit(const FileSizeLimit&) = delete;
+  FileSizeLimit& operator=(const FileSizeLimit&) = delete;
+  ~FileSizeLimit() {
+    ::setrlimit(RLIMIT_FSIZE, &old_);
+    std::signal(SIGXFSZ, oldAction_);
+  }
+
+ private:
+  sighandler_t oldAction_;
+  rlimit old_{};
+};
+
+TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileTheDiskIsFullThenStoresAgain) {
+  start();
+  {
+    const FileSizeLimit limit(200'000);
+    for (std::int64_t number = 0; number < 20'000; ++number) send(number);
+    ASSERT_TRUE(allIsStored());
+    EXPECT_GT(counted("dropped: disk full"), 0U);
+  }
+  const auto freed = std::chrono::steady_clock::now();
+  EXPECT_TRUE(storesAgain());
+  EXPECT_LT(std::chrono::steady_clock::now() - freed, std::chrono::seconds(5));
+  stop();
+
+  expectBalance();
+  EXPECT_THAT(platform.log.texts(LogLevel::kDefault), Contains(HasSubstr("storing again")));
+  EXPECT_THAT(rows(database(), "PRAGMA integrity_check"), ElementsAre("ok"));
+}
+
+TEST_F(SqliteStoreFailureTest, LogsAtMostOneErrorLineASecond) {
+  start();
+  const auto begun = std::chrono::steady_clock::now();
+  {
+    const FileSizeLimit limit(100'000);
+    for (std::int64_t number = 0; number < 40'000; ++number) send(number);
+    ASSERT_TRUE(allIsStored());
+  }
+  const auto seconds =
+      std::chrono::duration_cast<std::chrono::seconds>(std::chrono::steady_clock::now() - begun);
+  EXPECT_LE(platform.log.lines(LogLevel::kError).size(),
+            static_cast<std::size_t>(seconds.count()) + 1);
+  EXPECT_THAT(platform.log.texts(LogLevel::kError), Contains(HasSubstr("events dropped")));
+}
+
+TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileAnotherProcessLocksTheFile) {
+  start();
+  Database other;
+  ASSERT_EQ(other.open(database(), DatabaseAccess::kReadWrite), SQLITE_OK);
+  ASSERT_EQ(other.execute("BEGIN IMMEDIATE"), SQLITE_OK);
+  send(1);
+  ASSERT_TRUE(allIsStored());
+  EXPECT_EQ(counted("dropped: database locked"), 1U);
+
+  ASSERT_EQ(other.execute("ROLLBACK"), SQLITE_OK);
+  const auto freed = std::chrono::steady_clock::now();
+  EXPECT_TRUE(storesAgain());
+  EXPECT_LT(std::chrono::steady_clock::now() - freed, std::chrono::seconds(5));
+  stop();
+  expectBalance();
+}
+
+TEST_F(SqliteStoreFailureTest, GoesOnWhileAReaderHoldsAnOldSnapshot) {
+  start();
+  send(1);
+  ASSERT_TRUE(allIsStored());
+  Database reader;
+  ASSERT_EQ(reader.open(database(), DatabaseAccess::kReadOnly), SQLITE_OK);
+  ASSERT_EQ(reader.execute("BEGIN; SELECT count(*) FROM analytics_events"), SQLITE_OK);
+  for (std::int64_t number = 0; number < 20'000; ++number) send(number);
+  ASSERT_TRUE(allIsStored());
+  EXPECT_EQ(dropped(), 0U);
+  reader.close();
+  stop();
+  expectBalance();
+}
+
+TEST_F(SqliteStoreFailureTest, BeginsANewDatabaseWhenTheFileIsDeleted) {
+  start();
+  send(1);
+  ASSERT_TRUE(allIsStored());
+  for (const char* suffix : {"", "-wal", "-shm"}) {
+    std::filesystem::remove(database().native() + suffix);
+  }
+  send(2);
+  ASSERT_TRUE(allIsStored());
+  EXPECT_THAT(payloads(), ElementsAre(numbered(2)));
+  EXPECT_THAT(platform.log.texts(LogLevel::kError), Contains(HasSubstr("removed or replaced")));
+}
+
+TEST_F(SqliteStoreFailureTest, BeginsANewDatabaseWhenItsWholeDirectoryIsDeleted) {
+  start();
+  send(1);
+  ASSERT_TRUE(allIsStored());
+  std::filesystem::remove_all(options.directory);
+  send(2);
+  ASSERT_TRUE(allIsStored());
+  EXPECT_THAT(payloads(), ElementsAre(numbered(2)));
+}
+
+TEST_F(SqliteStoreFailureTest, GoesOnWithTheDatabaseThatWasPutInThePlaceOfItsOwn) {
+  start();
+  send(1);
+  stop();
+  const std::string copy = readFile(database());
+  start();
+  send(2);
+  ASSERT_TRUE(allIsStored());
+  for (const char* suffix : {"", "-wal", "-shm"}) {
+    std::filesystem::remove(database().native() + suffix);
+  }
+  writeFile(database(), copy);
+  send(3);
+  stop();
+  EXPECT_THAT(payloads(), ElementsAre(numbered(1), numbered(3)));
+}
+
+TEST_F(SqliteStoreFailureTest, SetsAFileThatIsDestroyedWhileItRunsAsideAndGoesOn) {
+  options.maxMegabytes = 4;
+  start();
+  const std::string filler(500, 'x');
+  const auto sendLong = [&] {
+    service->sendAnalyticsEventLazy("a", [filler] { return Dictionary{{"k", filler}}; });
+  };
+  for (int number = 0; number < 10'000; ++number) sendLong();
+  ASSERT_TRUE(allIsStored());
+  // Written over in place, log included: what a failing disk or a stray program does.
+  for (const char* suffix : {"", "-wal"}) {
+    const std::string path = database().native() + suffix;
+    std::FILE* file = std::fopen(path.c_str(), "r+");
+    ASSERT_NE(file, nullptr);
+    const std::string garbage(std::filesystem::file_size(path), '\x33');
+    ASSERT_EQ(std::fwrite(garbage.data(), 1, garbage.size(), file), garbage.size());
+    ASSERT_EQ(std::fclose(file), 0);
+  }
+  EXPECT_TRUE(eventually([&] {
+    sendLong();
+    return !setAsideFiles().empty();
+  }));
+  EXPECT_TRUE(storesAgain());
+  stop();
+  EXPECT_THAT(rows(database(), "PRAGMA integrity_check"), ElementsAre("ok"));
+  EXPECT_THAT(payloads(), Contains(numbered(-1)));
+  EXPECT_EQ(counted("received"), counted("stored") + dropped());
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,101 @@
+#include <atomic>
+#include <csignal>
+#include <string>
+#include <vector>
+
+#include <sys/mman.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include "platform/linux/store/StoreTestSupport.h"
+
+// What is left of a store whose process was killed under load.
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using ::testing::ElementsAre;
+
+using Clock = std::chrono::steady_clock;
+constexpr std::size_t kMostEvents = 4'000'000;
+
+// Written by the process that is going to be killed, read by the one that kills it.
+struct Progress {
+  std::atomic<std::size_t> sent;
+  Clock::time_point times[kMostEvents];  // when the sending of an event was over
+};
+
+class SqliteStoreKillTest : public StoreTest {
+ protected:
+  SqliteStoreKillTest() {
+    void* memory = ::mmap(nullptr, sizeof(Progress), PROT_READ | PROT_WRITE,
+                          MAP_SHARED | MAP_ANONYMOUS | MAP_NORESERVE, -1, 0);
+    progress_ = static_cast<Progress*>(memory);
+  }
+  ~SqliteStoreKillTest() override { ::munmap(progress_, sizeof(Progress)); }
+
+  [[noreturn]] void sendUntilKilled() {
+    if (open().has_value()) ::_exit(1);
+    for (std::size_t number = 0; number < kMostEvents; ++number) {
+      send(static_cast<std::int64_t>(number));
+      progress_->times[number] = Clock::now();
+      progress_->sent.store(number + 1, std::memory_order_release);
+    }
+    ::_exit(2);
+  }
+
+  // Kills a sending process so long after its start; gives how many of its events are older than
+  // half a second at that moment.
+  std::size_t killAfter(std::chrono::milliseconds time) {
+    progress_->sent = 0;
+    const pid_t child = ::fork();
+    if (child == 0) sendUntilKilled();
+    EXPECT_TRUE(eventually([&] { return progress_->sent > 0; }));
+    ::usleep(static_cast<useconds_t>(time.count()) * 1000);
+    ::kill(child, SIGKILL);
+    const Clock::time_point killed = Clock::now();
+    int status = 0;
+    ::waitpid(child, &status, 0);
+    EXPECT_TRUE(WIFSIGNALED(status)) << "the child ended by itself with " << status;
+    const std::size_t sent = progress_->sent.load(std::memory_order_acquire);
+    std::size_t old = 0;
+    while (old < sent && progress_->times[old] < killed - std::chrono::milliseconds(500)) ++old;
+    return old;
+  }
+
+  void expectSoundAndComplete(std::size_t atLeast) {
+    ASSERT_THAT(rows(database(), "PRAGMA integrity_check"), ElementsAre("ok"));
+    const std::vector<std::string> stored = payloads();
+    EXPECT_GE(stored.size(), atLeast);
+    for (std::size_t number = 0; number < stored.size(); ++number) {
+      ASSERT_EQ(stored[number], numbered(static_cast<std::int64_t>(number)));
+    }
+  }
+
+ private:
+  Progress* progress_;
+};
+
+TEST_F(SqliteStoreKillTest, LacksAtMostWhatWasSentInTheLastHalfSecond) {
+  for (const int time : {30, 700, 1100}) {
+    std::filesystem::remove_all(options.directory);
+    const std::size_t old = killAfter(std::chrono::milliseconds(time));
+    if (time > 600) {
+      EXPECT_GT(old, 1000U);
+    }
+    expectSoundAndComplete(old);
+  }
+}
+
+TEST_F(SqliteStoreKillTest, AKilledStoreOpensAgainAndGoesOn) {
+  killAfter(std::chrono::milliseconds(200));
+  const std::size_t before = payloads().size();
+  start();
+  send(-1);
+  stop();
+  EXPECT_EQ(payloads().size(), before + 1);
+  EXPECT_TRUE(setAsideFiles().empty());
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,169 @@
+#include "platform/linux/store/StoreOpening.h"
+
+#include <string>
+
+#include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/StoreTestSupport.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
+
+class StoreOpeningTest : public StoreTest {
+ protected:
+  // A store with some thousand events, closed in good order.
+  void makeStore() {
+    start();
+    for (std::int64_t number = 0; number < 4000; ++number) send(number);
+    stop();
+  }
+
+  void expectNewStoreAndOldOneSetAside() {
+    start();
+    send(1);
+    stop();
+    EXPECT_THAT(payloads(), ElementsAre(numbered(1)));
+    EXPECT_THAT(setAsideFiles(), Not(IsEmpty()));
+    EXPECT_THAT(platform.log.texts(LogLevel::kError),
+                ElementsAre(HasSubstr("was set aside as " + setAsideFiles().front().native())));
+  }
+};
+
+TEST_F(StoreOpeningTest, MakesDirectoriesThatAreMissing) {
+  options.directory = scratch.path() / "a" / "b" / "c";
+  start();
+  EXPECT_TRUE(std::filesystem::exists(database()));
+}
+
+TEST_F(StoreOpeningTest, SaysThatTheDirectoryCannotBeMade) {
+  writeFile(scratch.path() / "file", "");
+  options.directory = scratch.path() / "file" / "state";
+  const auto error = open();
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->kind, StoreError::Kind::kDirectory);
+  EXPECT_THAT(error->description, HasSubstr((scratch.path() / "file").native()));
+}
+
+TEST_F(StoreOpeningTest, SaysThatTheDirectoryCannotBeWritten) {
+  options.directory = "/proc/self";
+  const auto error = open();
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->kind, StoreError::Kind::kDirectory);
+}
+
+TEST_F(StoreOpeningTest, RefusesAStoreThatAnotherServiceWrites) {
+  start();
+  SqliteStore second(options, {platform.clock, platform.statistics, backpressure});
+  const auto error = second.open();
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->kind, StoreError::Kind::kInUse);
+  EXPECT_THAT(error->description, HasSubstr("another service"));
+}
+
+TEST_F(StoreOpeningTest, TakesTheStoreOverOnceTheOtherServiceIsGone) {
+  start();
+  stop();
+  start();
+}
+
+TEST_F(StoreOpeningTest, LeavesADatabaseOfANewerVersionAsItIs) {
+  makeStore();
+  execute(database(), "PRAGMA user_version = 99");
+  const std::string before = readFile(database());
+
+  const auto error = open();
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->kind, StoreError::Kind::kNewerVersion);
+  EXPECT_THAT(error->description, HasSubstr("99"));
+  EXPECT_EQ(readFile(database()), before);
+  EXPECT_THAT(setAsideFiles(), IsEmpty());
+}
+
+TEST_F(StoreOpeningTest, SetsAFileOfRandomBytesAsideAndKeepsIt) {
+  std::string garbage(50'000, '\0');
+  for (std::size_t index = 0; index < garbage.size(); ++index) {
+    garbage[index] = static_cast<char>(index * 2'654'435'761U >> 13U);
+  }
+  writeFile(database(), garbage);
+
+  expectNewStoreAndOldOneSetAside();
+  EXPECT_EQ(readFile(setAsideFiles().front()), garbage);
+}
+
+TEST_F(StoreOpeningTest, SetsATextFileAside) {
+  writeFile(database(), "not a database at all\n");
+  expectNewStoreAndOldOneSetAside();
+}
+
+TEST_F(StoreOpeningTest, SetsATruncatedDatabaseAside) {
+  makeStore();
+  std::filesystem::resize_file(database(), std::filesystem::file_size(database()) / 2);
+  expectNewStoreAndOldOneSetAside();
+}
+
+TEST_F(StoreOpeningTest, SetsADatabaseWithABrokenPageAside) {
+  makeStore();
+  std::string content = readFile(database());
+  content.replace(content.size() / 2, 20'000, std::string(20'000, '\xA5'));
+  writeFile(database(), content);
+  expectNewStoreAndOldOneSetAside();
+}
+
+TEST_F(StoreOpeningTest, SetsTwoDamagedFilesAsideUnderTwoNames) {
+  writeFile(database(), "not a database");
+  start();
+  stop();
+  writeFile(database(), "not a database either");
+  start();
+  stop();
+  EXPECT_THAT(setAsideFiles(), SizeIs(2));
+}
+
+TEST_F(StoreOpeningTest, TakesAnEmptyFileForANewStore) {
+  writeFile(database(), "");
+  start();
+  send(1);
+  stop();
+  EXPECT_THAT(payloads(), ElementsAre(numbered(1)));
+  EXPECT_THAT(setAsideFiles(), IsEmpty());
+}
+
+TEST_F(StoreOpeningTest, KeepsTheEventsOfADatabaseWhoseLogIsGarbage) {
+  makeStore();
+  writeFile(database().native() + "-wal", std::string(100'000, '\x5A'));
+  start();
+  stop();
+  EXPECT_THAT(payloads(), SizeIs(4000));
+  EXPECT_THAT(rows(database(), "PRAGMA integrity_check"), ElementsAre("ok"));
+}
+
+TEST_F(StoreOpeningTest, SetsALogWithoutItsDatabaseAside) {
+  writeFile(database().native() + "-wal", "the log of a database that is gone");
+  start();
+  send(1);
+  stop();
+  EXPECT_THAT(payloads(), ElementsAre(numbered(1)));
+  EXPECT_THAT(setAsideFiles(), SizeIs(1));
+}
+
+TEST_F(StoreOpeningTest, SaysThatADirectoryIsInThePlaceOfTheDatabase) {
+  std::filesystem::create_directories(database());
+  const auto error = open();
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->kind, StoreError::Kind::kCannotOpen);
+}
+
+TEST_F(StoreOpeningTest, MarksTheDatabaseWithItsVersion) {
+  start();
+  stop();
+  EXPECT_THAT(rows(database(), "PRAGMA user_version"),
+              ElementsAre(std::to_string(kStoreSchemaVersion)));
+  EXPECT_THAT(rows(database(), "PRAGMA journal_mode"), ElementsAre("wal"));
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

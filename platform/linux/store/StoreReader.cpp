@@ -1,0 +1,115 @@
+#include "platform/linux/store/StoreReader.h"
+
+#include <cerrno>
+#include <chrono>
+#include <cstdio>
+#include <system_error>
+
+#include <sys/stat.h>
+
+#include "platform/linux/store/EventScan.h"
+#include "platform/linux/store/StoreOpening.h"
+#include "platform/linux/store/StoreSchema.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::chrono::milliseconds kBusyTimeout{1000};
+
+// A URI by which SQLite takes the file as it is, without its log and without locks.
+std::string immutableURI(const std::string& path) {
+  std::string uri = "file:";
+  for (const char character : path) {
+    if (character == '?' || character == '#' || character == '%') {
+      char escaped[4];
+      std::snprintf(escaped, sizeof escaped, "%%%02X", static_cast<unsigned>(character));
+      uri += escaped;
+    } else {
+      uri += character;
+    }
+  }
+  return uri + "?immutable=1";
+}
+
+}  // namespace
+
+std::optional<StoreError> StoreReader::open(const std::filesystem::path& directory) {
+  database_.close();
+  files_.emplace(directory);
+  identity_.reset();
+  struct stat status {};
+  if (::stat(files_->database().c_str(), &status) != 0) {
+    const auto kind = errno == ENOENT || errno == ENOTDIR ? StoreError::Kind::kMissing
+                                                          : StoreError::Kind::kCannotOpen;
+    return StoreError{kind,
+                      files_->database().native() + ": " + std::system_category().message(errno)};
+  }
+  auto error = openDatabase();
+  if (error.has_value()) {
+    database_.close();
+  } else {
+    identity_ = FileIdentity{status.st_dev, status.st_ino};
+  }
+  return error;
+}
+
+std::optional<StoreError> StoreReader::openDatabase() {
+  const SqliteCode code = openFile();
+  if (code != SQLITE_OK) return failure(code);
+  const auto version = database_.queryInteger("PRAGMA user_version");
+  if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
+  const std::string& path = files_->database().native();
+  if (*version == 0) {
+    return StoreError{StoreError::Kind::kMissing, path + ": nothing was stored yet"};
+  }
+  if (*version <= kStoreSchemaVersion) return std::nullopt;
+  return StoreError{StoreError::Kind::kNewerVersion, path + ": the database has version " +
+                                                         std::to_string(*version) +
+                                                         ", this program knows versions up to " +
+                                                         std::to_string(kStoreSchemaVersion)};
+}
+
+SqliteCode StoreReader::openFile() {
+  const auto attempt = [this](const std::string& file) {
+    SqliteCode code = database_.open(file, DatabaseAccess::kReadOnly);
+    if (code != SQLITE_OK) return code;
+    sqlite3_busy_timeout(database_.get(), static_cast<int>(kBusyTimeout.count()));
+    // The first statement that reads the file finds out whether it can be read.
+    return database_.execute("PRAGMA schema_version");
+  };
+  const std::string& path = files_->database().native();
+  const SqliteCode code = attempt(path);
+  // Somebody who may read but not write beside the file cannot take part in its log; a file that
+  // was closed in good order has none and can be read as it is.
+  const bool needsLog = (code & 0xFF) == SQLITE_CANTOPEN || (code & 0xFF) == SQLITE_READONLY;
+  return needsLog && files_->logBytes() == 0 ? attempt(immutableURI(path)) : code;
+}
+
+std::optional<StoreError> StoreReader::forEachEvent(const EventFilter& filter,
+                                                    const EventCallback& callback) {
+  EventScan scan(database_, filter);
+  SqliteCode code = scan.begin();
+  EventScan::Piece piece;
+  while (code == SQLITE_OK && !scan.isAtEnd()) {
+    code = scan.next(piece);
+    for (const EventScan::Event& event : piece.events) {
+      callback({event.id, event.time, scan.nameOf(event.nameID), piece.payloads[event.payload]});
+    }
+  }
+  if (code != SQLITE_OK) return failure(code);
+  return std::nullopt;
+}
+
+bool StoreReader::isReplaced() const {
+  return !files_.has_value() || files_->identity() != identity_;
+}
+
+StoreError StoreReader::failure(SqliteCode code) const {
+  const bool damaged = meansDamage(code);
+  return {damaged ? StoreError::Kind::kDamaged : StoreError::Kind::kCannotOpen,
+          files_->database().native() +
+              (damaged ? ": the database is damaged: " : ": the database cannot be read: ") +
+              database_.errorText()};
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,179 @@
+#include "platform/linux/store/StoreReader.h"
+
+#include <string>
+#include <vector>
+
+#include "platform/linux/store/StoreTestSupport.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
+
+class StoreReaderTest : public StoreTest {
+ protected:
+  // Events 0 to count - 1, a second apart from time 1,000 on, named "even" and "odd".
+  void store1000(std::int64_t count) {
+    start();
+    for (std::int64_t number = 0; number < count; ++number) {
+      platform.clock.setCurrentDate({1000.0 + static_cast<double>(number)});
+      send(number, number % 2 == 0 ? "even" : "odd");
+    }
+    ASSERT_TRUE(allIsStored());
+  }
+
+  std::vector<std::string> read(const EventFilter& filter) {
+    StoreReader reader;
+    std::vector<std::string> found;
+    auto error = reader.open(options.directory);
+    if (!error) {
+      error = reader.forEachEvent(
+          filter, [&](const StoredEvent& event) { found.emplace_back(event.payload); });
+    }
+    EXPECT_FALSE(error.has_value()) << error->description;
+    return found;
+  }
+
+  StoreError::Kind openError() {
+    StoreReader reader;
+    const auto error = reader.open(options.directory);
+    EXPECT_TRUE(error.has_value());
+    return error.value_or(StoreError{}).kind;
+  }
+};
+
+TEST_F(StoreReaderTest, ReadsAllEventsInOrderWhileTheServiceRuns) {
+  store1000(3);
+  EXPECT_THAT(read({}), ElementsAre(numbered(0), numbered(1), numbered(2)));
+}
+
+TEST_F(StoreReaderTest, ReadsWhenNoServiceRuns) {
+  store1000(3);
+  stop();
+  EXPECT_THAT(read({}), SizeIs(3));
+}
+
+TEST_F(StoreReaderTest, GivesTimeAndName) {
+  store1000(2);
+  StoreReader reader;
+  ASSERT_EQ(reader.open(options.directory), std::nullopt);
+  std::vector<std::string> found;
+  const auto error = reader.forEachEvent({}, [&](const StoredEvent& event) {
+    found.push_back(std::to_string(event.time) + " " + std::string(event.name));
+  });
+  EXPECT_EQ(error, std::nullopt);
+  EXPECT_THAT(found, ElementsAre("1000.000000 even", "1001.000000 odd"));
+}
+
+TEST_F(StoreReaderTest, FiltersByNamePattern) {
+  store1000(6);
+  EXPECT_THAT(read({.name = "o*"}), ElementsAre(numbered(1), numbered(3), numbered(5)));
+  EXPECT_THAT(read({.name = "x*"}), IsEmpty());
+}
+
+TEST_F(StoreReaderTest, FiltersByTime) {
+  store1000(5000);
+  EXPECT_THAT(read({.since = 5997.0}), ElementsAre(numbered(4997), numbered(4998), numbered(4999)));
+  EXPECT_THAT(read({.until = 1002.0}), ElementsAre(numbered(0), numbered(1)));
+  EXPECT_THAT(read({.since = 3000.0, .until = 3002.0}),
+              ElementsAre(numbered(2000), numbered(2001)));
+  EXPECT_THAT(read({.since = 9999.0}), IsEmpty());
+  EXPECT_THAT(read({.until = 5.0}), IsEmpty());
+}
+
+TEST_F(StoreReaderTest, FindsEventsByTimeThoughTheClockWasSetBack) {
+  start();
+  for (std::int64_t number = 0; number < 2000; ++number) {
+    platform.clock.setCurrentDate({5000.0});
+    send(number);
+  }
+  platform.clock.setCurrentDate({100.0});
+  send(-1);
+  for (std::int64_t number = 0; number < 2000; ++number) {
+    platform.clock.setCurrentDate({5001.0});
+    send(number);
+  }
+  ASSERT_TRUE(allIsStored());
+  EXPECT_THAT(read({.until = 101.0}), ElementsAre(numbered(-1)));
+}
+
+TEST_F(StoreReaderTest, GivesTheNewestOnesNewestLast) {
+  store1000(3000);
+  EXPECT_THAT(read({.newest = 2}), ElementsAre(numbered(2998), numbered(2999)));
+  EXPECT_THAT(read({.name = "even", .newest = 2}), ElementsAre(numbered(2996), numbered(2998)));
+  EXPECT_THAT(read({.newest = 10'000}), SizeIs(3000));
+  EXPECT_THAT(read({.newest = 0}), IsEmpty());
+}
+
+TEST_F(StoreReaderTest, GivesOneOfTheTwoEventsOfAMessage) {
+  start();
+  send(7, "first");
+  send(7, "second");
+  ASSERT_TRUE(allIsStored());
+  EXPECT_THAT(read({.newest = 1}), SizeIs(1));
+  EXPECT_THAT(read({.name = "second"}), SizeIs(1));
+}
+
+TEST_F(StoreReaderTest, ReadsOnAfterAnEvent) {
+  store1000(5);
+  StoreReader reader;
+  ASSERT_EQ(reader.open(options.directory), std::nullopt);
+  std::vector<StoredEventID> ids;
+  ASSERT_EQ(reader.forEachEvent({}, [&](const StoredEvent& event) { ids.push_back(event.id); }),
+            std::nullopt);
+  EXPECT_THAT(read({.after = ids[2]}), ElementsAre(numbered(3), numbered(4)));
+  EXPECT_THAT(read({.after = ids[4]}), IsEmpty());
+}
+
+TEST_F(StoreReaderTest, DoesNotHoldASnapshotDuringTheCallback) {
+  store1000(3);
+  StoreReader reader;
+  ASSERT_EQ(reader.open(options.directory), std::nullopt);
+  bool checkpointed = false;
+  ASSERT_EQ(reader.forEachEvent(
+                {.newest = 1},
+                [&](const StoredEvent&) {
+                  checkpointed = rows(database(), "PRAGMA wal_checkpoint(PASSIVE)").size() == 1;
+                  send(99);
+                  EXPECT_TRUE(allIsStored());
+                }),
+            std::nullopt);
+  EXPECT_TRUE(checkpointed);
+  EXPECT_THAT(read({.newest = 1}), ElementsAre(numbered(99)));
+}
+
+TEST_F(StoreReaderTest, SaysThatThereIsNoStore) {
+  EXPECT_EQ(openError(), StoreError::Kind::kMissing);
+}
+
+TEST_F(StoreReaderTest, SaysThatNothingWasStoredYet) {
+  writeFile(database(), "");
+  EXPECT_EQ(openError(), StoreError::Kind::kMissing);
+}
+
+TEST_F(StoreReaderTest, SaysThatTheFileIsDamagedAndLeavesItThere) {
+  writeFile(database(), "this is not a database, whatever its name says");
+  EXPECT_EQ(openError(), StoreError::Kind::kDamaged);
+  EXPECT_TRUE(std::filesystem::exists(database()));
+}
+
+TEST_F(StoreReaderTest, SaysThatTheDatabaseIsOfANewerVersion) {
+  store1000(1);
+  stop();
+  execute(database(), "PRAGMA user_version = 7");
+  EXPECT_EQ(openError(), StoreError::Kind::kNewerVersion);
+}
+
+TEST_F(StoreReaderTest, NoticesThatTheDatabaseWasReplaced) {
+  store1000(1);
+  StoreReader reader;
+  ASSERT_EQ(reader.open(options.directory), std::nullopt);
+  EXPECT_FALSE(reader.isReplaced());
+  std::filesystem::rename(database(), database().native() + ".old");
+  EXPECT_TRUE(reader.isReplaced());
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

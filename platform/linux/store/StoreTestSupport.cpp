@@ -1,0 +1,111 @@
+#include "platform/linux/store/StoreTestSupport.h"
+
+#include <algorithm>
+#include <cstdlib>
+#include <fstream>
+#include <iterator>
+#include <ostream>
+#include <thread>
+
+namespace halvox::platform::linux_ {
+
+ScratchDirectory::ScratchDirectory() {
+  std::string name = ::testing::TempDir() + "halvox-store-XXXXXX";
+  if (::mkdtemp(name.data()) == nullptr) throw std::runtime_error("no scratch directory");
+  path_ = name;
+}
+
+ScratchDirectory::~ScratchDirectory() {
+  std::error_code ignored;
+  std::filesystem::remove_all(path_, ignored);
+}
+
+bool eventually(const std::function<bool()>& holds) {
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+  while (!holds()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    std::this_thread::sleep_for(std::chrono::milliseconds(1));
+  }
+  return true;
+}
+
+std::vector<std::string> rows(const std::filesystem::path& database, std::string_view sql) {
+  Database connection;
+  Statement statement;
+  std::vector<std::string> result;
+  if (connection.open(database, DatabaseAccess::kReadOnly) != SQLITE_OK ||
+      connection.prepare(sql, statement) != SQLITE_OK) {
+    return {"error: " + connection.errorText()};
+  }
+  sqlite3_busy_timeout(connection.get(), 5000);
+  SqliteCode code = SQLITE_ROW;
+  while ((code = statement.step()) == SQLITE_ROW) {
+    std::string row;
+    for (int column = 0; column < statement.columns(); ++column) {
+      if (column > 0) row += '|';
+      row += statement.text(column);
+    }
+    result.push_back(row);
+  }
+  if (code != SQLITE_DONE) result.push_back("error: " + connection.errorText());
+  return result;
+}
+
+void execute(const std::filesystem::path& database, const std::string& sql) {
+  Database connection;
+  ASSERT_EQ(connection.open(database, DatabaseAccess::kReadWrite), SQLITE_OK);
+  ASSERT_EQ(connection.execute(sql), SQLITE_OK) << connection.errorText();
+}
+
+std::string readFile(const std::filesystem::path& path) {
+  std::ifstream stream(path, std::ios::binary);
+  return {std::istreambuf_iterator<char>(stream), {}};
+}
+
+void writeFile(const std::filesystem::path& path, std::string_view content) {
+  std::filesystem::create_directories(path.parent_path());
+  std::ofstream stream(path, std::ios::binary | std::ios::trunc);
+  stream << content;
+}
+
+std::optional<StoreError> StoreTest::open() {
+  service.reset();
+  store.reset();
+  store = std::make_unique<SqliteStore>(
+      options, SqliteStore::Environment{platform.clock, platform.statistics, backpressure});
+  service = std::make_unique<SqliteAnalyticsService>(*store, platform.clock);
+  return store->open();
+}
+
+void StoreTest::send(std::int64_t number, const std::string& name) {
+  service->sendAnalyticsEventLazy(name, [number] { return Dictionary{{"number", number}}; });
+}
+
+bool StoreTest::allIsStored() {
+  return eventually([this] { return store->waiting() == 0; });
+}
+
+std::vector<std::filesystem::path> StoreTest::setAsideFiles() const {
+  std::vector<std::filesystem::path> found;
+  for (const auto& entry : std::filesystem::directory_iterator(options.directory)) {
+    if (entry.path().filename().native().starts_with("halvox.db.damaged-")) {
+      found.push_back(entry.path());
+    }
+  }
+  std::ranges::sort(found);
+  return found;
+}
+
+std::uint64_t StoreTest::dropped() const {
+  std::uint64_t sum = 0;
+  for (const auto& [name, count] : platform.statistics.values("analytics")) {
+    if (name.starts_with("dropped")) sum += count;
+  }
+  return sum;
+}
+
+std::string numbered(std::int64_t number) { return "{\"number\":" + std::to_string(number) + "}"; }
+
+void PrintTo(const StoreError& error, std::ostream* stream) { *stream << error.description; }
+
+}  // namespace halvox::platform::linux_

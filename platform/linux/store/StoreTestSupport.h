@@ -1,0 +1,83 @@
+#pragma once
+
+#include <chrono>
+#include <filesystem>
+#include <functional>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "platform/fake/FakePlatform.h"
+#include "platform/linux/store/SqliteAnalyticsService.h"
+#include "platform/linux/store/SqliteStore.h"
+
+namespace halvox::platform::linux_ {
+
+// A directory that is removed with all its content.
+class ScratchDirectory {
+ public:
+  ScratchDirectory();
+  ScratchDirectory(const ScratchDirectory&) = delete;
+  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
+  ~ScratchDirectory();
+  [[nodiscard]] const std::filesystem::path& path() const { return path_; }
+
+ private:
+  std::filesystem::path path_;
+};
+
+// Waits until it holds, looking every millisecond; false after ten seconds.
+[[nodiscard]] bool eventually(const std::function<bool()>& holds);
+
+// The rows of a query as the columns' texts joined by '|', read by a connection of its own.
+[[nodiscard]] std::vector<std::string> rows(const std::filesystem::path& database,
+                                            std::string_view sql);
+void execute(const std::filesystem::path& database, const std::string& sql);
+
+[[nodiscard]] std::string readFile(const std::filesystem::path& path);
+void writeFile(const std::filesystem::path& path, std::string_view content);
+
+// A store in a scratch directory, over fakes, with a service for events.
+class StoreTest : public ::testing::Test {
+ protected:
+  StoreTest() { options.directory = scratch.path() / "state" / "halvox"; }
+
+  // Makes a store of the options and opens it.
+  [[nodiscard]] std::optional<StoreError> open();
+  // The same, and expects it to succeed.
+  void start() { ASSERT_EQ(open(), std::nullopt) << "the store does not open"; }
+  // Drains and closes the store.
+  void stop() { store.reset(); }
+
+  // Sends an event whose payload is {"number": number}.
+  void send(std::int64_t number, const std::string& name = "com.tarno.test");
+  [[nodiscard]] bool allIsStored();
+  [[nodiscard]] std::filesystem::path database() const { return options.directory / "halvox.db"; }
+  [[nodiscard]] std::vector<std::string> payloads() const {
+    return rows(database(), "SELECT payload FROM analytics_events");
+  }
+  [[nodiscard]] std::vector<std::filesystem::path> setAsideFiles() const;
+  [[nodiscard]] std::uint64_t counted(std::string_view name) const {
+    return platform.statistics.value("analytics", name);
+  }
+  // The sum of all that was dropped, for whatever reason.
+  [[nodiscard]] std::uint64_t dropped() const;
+
+  ScratchDirectory scratch;
+  FakePlatform platform;
+  Backpressure backpressure;
+  StoreOptions options;
+  std::unique_ptr<SqliteStore> store;
+  std::unique_ptr<SqliteAnalyticsService> service;
+};
+
+// The payload of send(number).
+[[nodiscard]] std::string numbered(std::int64_t number);
+
+void PrintTo(const StoreError& error, std::ostream* stream);
+
+}  // namespace halvox::platform::linux_

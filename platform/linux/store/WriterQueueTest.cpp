@@ -1,0 +1,153 @@
+#include "platform/linux/store/WriterQueue.h"
+
+#include <atomic>
+#include <thread>
+
+#include <gtest/gtest.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr QueueLimits kSmall{.softRecords = 8,
+                             .softBytes = 1000,
+                             .hardFactor = 2,
+                             .gatherTime = std::chrono::milliseconds(0),
+                             .gatherRecords = 4};
+
+WriterQueue::Time soon() { return std::chrono::steady_clock::now(); }
+WriterQueue::Time never() { return std::chrono::steady_clock::now() + std::chrono::hours(1); }
+
+void addMany(WriterQueue& queue, int count) {
+  for (int index = 0; index < count; ++index) ASSERT_TRUE(queue.add([] {}));
+}
+
+TEST(WriterQueueTest, RaisesBackpressureAtTheSoftLimit) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+
+  addMany(queue, 7);
+  EXPECT_FALSE(backpressure.isHigh());
+  addMany(queue, 1);
+  EXPECT_TRUE(backpressure.isHigh());
+}
+
+TEST(WriterQueueTest, RelievesBackpressureBelowAQuarterAndSaysSo) {
+  Backpressure backpressure;
+  int reliefs = 0;
+  backpressure.setReliefHandler([&] { ++reliefs; });
+  WriterQueue queue(kSmall, backpressure);
+  addMany(queue, 8);
+  ASSERT_TRUE(queue.take(soon(), [] {}));
+
+  queue.finish(5, 0);
+  EXPECT_TRUE(backpressure.isHigh());
+  queue.finish(1, 0);
+  EXPECT_FALSE(backpressure.isHigh());
+  EXPECT_EQ(reliefs, 1);
+}
+
+TEST(WriterQueueTest, MakesCallersWaitAtTheHardLimitUntilThereIsRoom) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  addMany(queue, 16);
+  std::atomic<bool> added{false};
+  std::thread caller([&] {
+    EXPECT_TRUE(queue.add([] {}));
+    added = true;
+  });
+
+  ASSERT_TRUE(queue.take(soon(), [] {}));
+  EXPECT_FALSE(added);
+  queue.finish(1, 0);
+  caller.join();
+  EXPECT_TRUE(added);
+  EXPECT_EQ(queue.waiting(), 16U);
+}
+
+TEST(WriterQueueTest, HoldsFewerRecordsWhenTheirPayloadsAreLarge) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  addMany(queue, 1);
+  ASSERT_TRUE(queue.take(soon(), [] {}));
+  queue.finish(1, 500);
+
+  addMany(queue, 1);
+  EXPECT_FALSE(backpressure.isHigh());
+  addMany(queue, 1);
+  EXPECT_TRUE(backpressure.isHigh());
+}
+
+TEST(WriterQueueTest, GathersUntilManyWait) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  std::atomic<bool> taken{false};
+  std::thread writer([&] {
+    EXPECT_TRUE(queue.take(never(), [] {}));
+    taken = true;
+  });
+
+  addMany(queue, 3);
+  EXPECT_FALSE(taken);
+  addMany(queue, 1);
+  writer.join();
+  EXPECT_TRUE(taken);
+}
+
+TEST(WriterQueueTest, EndsGatheringWhenItsTimeIsOver) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  addMany(queue, 1);
+  const auto limit = std::chrono::steady_clock::now() + std::chrono::milliseconds(30);
+
+  EXPECT_TRUE(queue.take(limit, [] {}));
+  EXPECT_GE(std::chrono::steady_clock::now(), limit);
+}
+
+TEST(WriterQueueTest, LetsTheWriterFinishAfterClosingAndRefusesWhatComesLater) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  addMany(queue, 2);
+
+  queue.close();
+  EXPECT_FALSE(queue.add([] { FAIL() << "was run though the queue is closed"; }));
+  EXPECT_TRUE(queue.take(never(), [] {}));
+  queue.finish(2, 0);
+  EXPECT_FALSE(queue.take(never(), [] {}));
+}
+
+TEST(WriterQueueTest, ClosingFreesCallersThatWaitForRoom) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  addMany(queue, 16);
+  std::thread caller([&] { EXPECT_FALSE(queue.add([] {})); });
+
+  queue.close();
+  caller.join();
+}
+
+TEST(WriterQueueTest, CountsWhatManyThreadsAddAtOnce) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  constexpr std::uint64_t kEach = 2000;
+  std::uint64_t inside = 0;  // under the queue's lock
+  std::vector<std::thread> callers;
+  for (int caller = 0; caller < 4; ++caller) {
+    callers.emplace_back([&] {
+      for (std::uint64_t index = 0; index < kEach; ++index) {
+        EXPECT_TRUE(queue.add([&] { ++inside; }));
+      }
+    });
+  }
+  std::uint64_t done = 0;
+  while (done < 4 * kEach) {
+    std::uint64_t batch = 0;
+    ASSERT_TRUE(queue.take(soon(), [&] { batch = std::exchange(inside, 0); }));
+    queue.finish(batch, batch);
+    done += batch;
+  }
+  for (std::thread& caller : callers) caller.join();
+  EXPECT_EQ(queue.waiting(), 0U);
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_
