@@ -221,10 +221,12 @@ TEST(FrameWriterTest, VariantsTakeTheNaturalType) {
 }
 
 TEST(FrameWriterTest, ValuesInVariantsComeBackAsTheyWere) {
+  Value deep = 1;
+  for (int level = 0; level < 12; ++level) deep = Value(Array{deep});
   const Value values[] = {
+      deep,
       Array{1, "two", Array{3.0, true}, Dictionary{{"k", Array{}}}},
       Dictionary{{"a", Dictionary{{"b", Array{Date{1}, Date{2}}}}}, {"c", std::nan("")}},
-      Array{Array{Array{Array{Array{Array{Array{Array{Array{Array{Array{1}}}}}}}}}}},
   };
 
   for (const Value& value : values) EXPECT_EQ(roundTrip("v", value), value) << describe(value);

@@ -83,7 +83,8 @@ std::map<std::string_view, Values> expectedContainers() {
       {"nested_dictionaries", {Dictionary{{"outer", Dictionary{{"inner", 7}}}}}},
       {"array_of_dictionaries", {Array{Dictionary{{"a", 1.0}}, Dictionary{}}}},
       {"variants_in_variants", {std::int64_t{5}}},
-      {"send_message", {tenFields(), 14U, std::uint16_t{18}, Array{Array{std::int64_t{4711}}}}},
+      {"send_message",
+       {tenFields(), 14U, std::uint16_t{18}, Array{Value(Array{std::int64_t{4711}})}}},
       {"send_message_without_ids", {Dictionary{}, 1U, std::uint16_t{2}, Array{}}},
   };
 }
