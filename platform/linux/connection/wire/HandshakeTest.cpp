@@ -37,6 +37,13 @@ Outcome converse(std::string_view input, std::size_t pieceSize = SIZE_MAX) {
   return outcome;
 }
 
+// What a client says in that many lines.
+std::string lines(std::initializer_list<std::string_view> texts) {
+  std::string input = kNul;
+  for (const std::string_view text : texts) input.append(text).append("\r\n");
+  return input;
+}
+
 TEST(ServerHandshakeTest, ExternalWithTheUidOfTheSocketIsAccepted) {
   const Outcome outcome = converse(kNul + "AUTH EXTERNAL 31303030\r\nBEGIN\r\n");
 
@@ -88,7 +95,7 @@ TEST(ServerHandshakeTest, FileDescriptorsAreNotTaken) {
 
 TEST(ServerHandshakeTest, BytesOfTheFirstMessageAreLeft) {
   const std::string handshake = kNul + "AUTH EXTERNAL\r\nDATA\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n";
-  const std::string input = handshake + "l\1\0\1\r\nBEGIN\r\n";
+  const std::string input = handshake + std::string("l\1\0\1\r\nBEGIN\r\n", 13);
 
   for (const std::size_t pieceSize : {std::size_t{1}, std::size_t{3}, input.size()}) {
     const Outcome outcome = converse(input, pieceSize);
@@ -113,11 +120,10 @@ TEST(ServerHandshakeTest, PiecesOfAnySizeGiveTheSameAnswers) {
 
 TEST(ServerHandshakeTest, CancelAndErrorGoBackToTheStart) {
   for (const char* line : {"CANCEL", "ERROR", "ERROR with a reason"}) {
-    const std::string back = std::string(line) + "\r\n";
-    EXPECT_EQ(converse(kNul + "AUTH EXTERNAL\r\n" + back).output, "DATA\r\n" + kRejected);
-    EXPECT_EQ(converse(kNul + "AUTH ANONYMOUS\r\n" + back).output, kOk + kRejected);
-    EXPECT_EQ(converse(kNul + "AUTH ANONYMOUS\r\n" + back + "BEGIN\r\n").state, State::kFailed);
-    EXPECT_EQ(converse(kNul + "AUTH ANONYMOUS\r\n" + back + "AUTH ANONYMOUS\r\nBEGIN\r\n").state,
+    EXPECT_EQ(converse(lines({"AUTH EXTERNAL", line})).output, "DATA\r\n" + kRejected);
+    EXPECT_EQ(converse(lines({"AUTH ANONYMOUS", line})).output, kOk + kRejected);
+    EXPECT_EQ(converse(lines({"AUTH ANONYMOUS", line, "BEGIN"})).state, State::kFailed);
+    EXPECT_EQ(converse(lines({"AUTH ANONYMOUS", line, "AUTH ANONYMOUS", "BEGIN"})).state,
               State::kDone);
   }
 }
