@@ -1,0 +1,47 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include <systemd/sd-bus.h>
+
+#include "platform/linux/UniqueHandle.h"
+
+namespace halvox::platform::linux_ {
+
+// What a method answered: its texts and numbers as text, or the name and text of an error.
+struct BusAnswer {
+  std::string text;
+  std::string errorName;
+  std::string errorText;
+};
+
+// A client of the usual make, on the systemd library.
+class BusClient {
+ public:
+  enum class Kind : bool { kPeer, kBusClient };
+
+  // A bus client introduces itself with Hello, a peer does not. Throws when it cannot connect.
+  explicit BusClient(const std::string& address, Kind kind = Kind::kBusClient);
+
+  // Calls a method of the test's object. `types` and `arguments` as sd_bus_message_append takes
+  // them, texts only.
+  BusAnswer call(const std::string& member, const std::string& text);
+  BusAnswer call(const std::string& member);
+  // Calls any method without arguments or with text arguments.
+  BusAnswer callAt(const std::string& path, const std::string& interface, const std::string& member,
+                   const std::vector<std::string>& texts = {});
+  void setDestination(std::string name) { destination_ = std::move(name); }
+  [[nodiscard]] std::string uniqueName() const;
+  [[nodiscard]] sd_bus* get() const { return bus_.get(); }
+
+ private:
+  UniqueHandle<sd_bus*, sd_bus_flush_close_unref> bus_;
+  std::string destination_;
+};
+
+using BusMessage = UniqueHandle<sd_bus_message*, sd_bus_message_unref>;
+
+}  // namespace halvox::platform::linux_

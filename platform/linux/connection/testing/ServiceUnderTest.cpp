@@ -1,0 +1,56 @@
+#include "platform/linux/connection/testing/ServiceUnderTest.h"
+
+#include <algorithm>
+#include <cstdlib>
+#include <stdexcept>
+#include <utility>
+
+namespace halvox::platform::linux_ {
+
+bool eventually(const std::function<bool()>& condition) {
+  const auto deadline = std::chrono::steady_clock::now() + kTestDeadline;
+  while (!condition()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
+    std::this_thread::sleep_for(std::chrono::milliseconds(1));
+  }
+  return true;
+}
+
+ScratchDirectory::ScratchDirectory() {
+  std::string name = (std::filesystem::temp_directory_path() / "halvox.XXXXXX").string();
+  if (mkdtemp(name.data()) == nullptr) throw std::runtime_error("no scratch directory");
+  path_ = name;
+}
+
+ScratchDirectory::~ScratchDirectory() {
+  std::error_code ignored;
+  std::filesystem::remove_all(path_, ignored);
+}
+
+ServiceUnderTest::ServiceUnderTest(const std::function<void(ConnectionOptions&)>& configure) {
+  ConnectionOptions options;
+  options.socket = socketPath();
+  options.signals = EndSignals::kLeaveAlone;
+  if (configure) configure(options);
+  service_.emplace(std::move(options), backpressure);
+  if (const auto error = service_->open()) throw std::runtime_error(error->description);
+  setTestConnectionService(&*service_);
+  service_->serviceListener().setDelegate(delegate);
+  thread_ = std::jthread([this] { service_->serviceListener().resume(); });
+}
+
+ServiceUnderTest::~ServiceUnderTest() { stop(); }
+
+std::size_t ServiceUnderTest::countLines(LogLevel level, std::string_view part) const {
+  const std::vector<std::string> texts = platform.log.texts(level);
+  return static_cast<std::size_t>(std::count_if(
+      texts.begin(), texts.end(),
+      [part](const std::string& text) { return text.find(part) != std::string::npos; }));
+}
+
+void ServiceUnderTest::stop() {
+  service_->requestStop();
+  if (thread_.joinable()) thread_.join();
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,65 @@
+#pragma once
+
+#include <chrono>
+#include <filesystem>
+#include <functional>
+#include <optional>
+#include <string>
+#include <thread>
+
+#include "platform/fake/FakePlatform.h"
+#include "platform/linux/connection/LinuxConnectionService.h"
+#include "platform/linux/connection/testing/TestInterface.h"
+#include "platform/linux/runtime/Backpressure.h"
+
+namespace halvox::platform::linux_ {
+
+// How long a test waits for something that must happen.
+inline constexpr std::chrono::seconds kTestDeadline{20};
+
+// True as soon as the condition holds, false when it does not within the deadline.
+bool eventually(const std::function<bool()>& condition);
+
+// A directory of its own, removed in the end.
+class ScratchDirectory {
+ public:
+  ScratchDirectory();
+  ScratchDirectory(const ScratchDirectory&) = delete;
+  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
+  ~ScratchDirectory();
+  [[nodiscard]] const std::filesystem::path& path() const { return path_; }
+
+ private:
+  std::filesystem::path path_;
+};
+
+// The service with the test's object, serving on a thread of its own in a scratch directory.
+class ServiceUnderTest {
+ public:
+  // Called with the options before the service is made.
+  explicit ServiceUnderTest(const std::function<void(ConnectionOptions&)>& configure = {});
+  ServiceUnderTest(const ServiceUnderTest&) = delete;
+  ServiceUnderTest& operator=(const ServiceUnderTest&) = delete;
+  ~ServiceUnderTest();
+
+  [[nodiscard]] std::filesystem::path socketPath() const { return directory_.path() / "s"; }
+  [[nodiscard]] std::string address() const { return "unix:path=" + socketPath().string(); }
+  [[nodiscard]] std::uint64_t count(std::string_view name) const {
+    return platform.statistics.value("connection", name);
+  }
+  // How many lines of the log of that level have that in them.
+  [[nodiscard]] std::size_t countLines(LogLevel level, std::string_view part) const;
+  // Ends the service's resume().
+  void stop();
+
+  FakePlatform platform;
+  Backpressure backpressure;
+  TestDelegate delegate;
+
+ private:
+  ScratchDirectory directory_;
+  std::optional<LinuxConnectionService> service_;
+  std::jthread thread_;
+};
+
+}  // namespace halvox::platform::linux_

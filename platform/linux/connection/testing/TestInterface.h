@@ -1,0 +1,80 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/connection.h"
+#include "platform/linux/Mutex.h"
+
+namespace halvox::platform::linux_ {
+
+// What the tests export: an object whose methods show each way in which a request can be treated.
+class TestObject final : public ExportedObject {
+ public:
+  [[nodiscard]] ResourceUse resourceUse() const override {
+    return {.bytes = heldBytes.load(), .sessions = sessions.load()};
+  }
+
+  // Requests to "busy" wait with their tokens, those to "hold" without.
+  void keepBusy(RequestToken token, ReplyCallback reply);
+  void holdReply(ReplyCallback reply);
+  void answerBusy();
+  void answerHeld();
+
+  std::atomic<std::uint64_t> delivered{0};
+  std::atomic<std::uint64_t> heldBytes{0};
+  std::atomic<std::uint64_t> sessions{0};
+
+ private:
+  struct Busy {
+    RequestToken token;
+    ReplyCallback reply;
+  };
+  Mutex mutex_;
+  std::vector<Busy> busy_ HALVOX_GUARDED_BY(mutex_);
+  std::vector<ReplyCallback> held_ HALVOX_GUARDED_BY(mutex_);
+};
+
+// Methods, in words:
+//   echo s → s        the text again, at once
+//   away s → s        the text again, from another thread
+//   twice s → s       the text, two times
+//   take a{sv}uqaax   nothing
+//   fail → b          the error 1 of com.tarno.audio.reporting
+//   hold x → b        true, once the test says so; carried out at once
+//   busy x → b        true, once the test says so; not carried out before
+//   create x → b      true; makes a session
+//   grow → b          true; may hold more
+//   list → ax         1000 numbers
+//   pid → u           the process that asks; 0 when no connection or request is current
+const NSXPCInterface& testInterface();
+inline constexpr const char* kTestPath = "/com/tarno/test/object";
+inline constexpr const char* kTestInterface = "com.tarno.test.Object";
+
+// Accepts every connection and exports one object, common to all, on it.
+class TestDelegate final : public NSXPCListenerDelegate {
+ public:
+  bool listenerShouldAcceptNewConnection(
+      const std::shared_ptr<NSXPCConnection>& connection) override;
+
+  // What happened to connections, such as "accepted 1234", "interrupted 1234", "invalidated 1234".
+  [[nodiscard]] std::vector<std::string> events() const;
+  [[nodiscard]] bool hasSeen(const std::string& event) const;
+
+  const std::shared_ptr<TestObject> object = std::make_shared<TestObject>();
+  std::atomic<bool> refuses{false};
+
+ private:
+  void note(const std::string& event);
+
+  mutable Mutex mutex_;
+  std::vector<std::string> events_ HALVOX_GUARDED_BY(mutex_);
+};
+
+// The service whose currentConnection() and currentRequest() the methods ask.
+void setTestConnectionService(const ConnectionService* service);
+
+}  // namespace halvox::platform::linux_
