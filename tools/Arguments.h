@@ -1,0 +1,33 @@
+#pragma once
+
+#include <chrono>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <variant>
+
+#include "client/HalvoxClient.h"
+
+// The texts of single arguments as what they stand for. Each function says, when it cannot, what
+// was wrong and what was expected.
+namespace halvox::tools {
+
+struct ArgumentError {
+  std::string message;
+};
+template <typename T>
+using Parsed = std::variant<T, ArgumentError>;
+
+// Whole numbers, decimal or with 0x hexadecimal.
+Parsed<client::ReporterID> parseReporterID(std::string_view text);
+// Names in any case of letters, or numbers.
+Parsed<client::Category> parseCategory(std::string_view text);
+Parsed<client::EventType> parseEventType(std::string_view text);
+Parsed<client::ServiceType> parseServiceType(std::string_view text);
+// Seconds, fractions allowed; more than 0.
+Parsed<std::chrono::milliseconds> parseSeconds(std::string_view text);
+// A moment, in seconds since 1970: RFC 3339 (without an offset in local time), the seconds
+// themselves, or how long before `now` it was (90s, 5m, 2h, 3d).
+Parsed<double> parseTime(std::string_view text, double now);
+
+}  // namespace halvox::tools

@@ -1,0 +1,105 @@
+#pragma once
+
+#include <chrono>
+#include <optional>
+#include <string>
+#include <variant>
+#include <vector>
+
+#include "client/HalvoxClient.h"
+
+// What halvoxctl can be asked for, as its arguments say it.
+namespace halvox::tools {
+
+using client::Category;
+using client::Dictionary;
+using client::EventType;
+using client::ReporterID;
+using client::ServiceType;
+
+// How a run of halvoxctl ends; documented in its manual page.
+enum class ExitStatus : int {
+  kDone = 0,
+  kRefused = 1,       // the service said no
+  kBadArguments = 2,  //
+  kNoService = 69,    // EX_UNAVAILABLE: nobody answers, the connection was lost, there is no store
+  kCannotWrite = 74,  // EX_IOERR: standard output takes nothing
+  kBadConfiguration = 78,  // EX_CONFIG
+};
+
+// Requests to the service.
+struct Create {
+  ReporterID id = 0;
+};
+struct SetType {
+  ReporterID id = 0;
+  ServiceType type = 0;
+};
+struct GetType {
+  ReporterID id = 0;
+};
+struct Configure {
+  ReporterID id = 0;
+  Dictionary configuration;
+};
+struct Start {
+  ReporterID id = 0;
+  std::optional<std::chrono::milliseconds> wait;  // for the answer, which comes at the stop
+};
+struct Send {
+  std::optional<std::vector<ReporterID>> ids;  // none: all active sessions
+  Category category = 0;
+  EventType type = 0;
+  Dictionary message;
+};
+struct Stop {
+  ReporterID id = 0;
+};
+struct Destroy {
+  ReporterID id = 0;
+};
+struct Valid {
+  ReporterID id = 0;
+};
+struct List {};
+struct Kill {};
+// In scripts only: what one connection can see that a single command cannot.
+struct WaitForStart {
+  ReporterID id = 0;
+  std::chrono::milliseconds timeout{};
+};
+struct Sleep {
+  std::chrono::milliseconds time{};
+};
+using Request = std::variant<Create, SetType, GetType, Configure, Start, Send, Stop, Destroy, Valid,
+                             List, Kill, WaitForStart, Sleep>;
+
+// One request per line, over one connection.
+struct RunScript {
+  std::string file;  // "-": standard input
+  bool keepGoing = false;
+};
+struct RunShell {};
+
+struct ShowEvents {
+  std::vector<std::string> names{};  // glob patterns; none: all
+  std::optional<double> since{};     // seconds since 1970
+  std::optional<double> until{};
+  std::optional<std::uint64_t> last{};
+  bool follow = false;
+  std::string database{};  // empty: where the service's configuration puts it
+};
+
+// What all commands take.
+struct CommonOptions {
+  bool json = false;
+  std::string socket;  // empty: the client's default
+  std::chrono::milliseconds timeout{5000};
+};
+
+struct Command {
+  std::variant<Request, RunScript, RunShell, ShowEvents> what;
+  CommonOptions options;
+};
+
+}  // namespace halvox::tools

@@ -1,0 +1,379 @@
+#include "tools/CommandLine.h"
+
+#include <algorithm>
+#include <chrono>
+#include <ctime>
+#include <iterator>
+#include <utility>
+
+#include <CLI/CLI.hpp>
+
+#include "tools/Arguments.h"
+#include "tools/HalvoxVersion.h"
+#include "tools/JsonText.h"
+
+namespace halvox::tools {
+namespace {
+
+constexpr const char* kSessionNote =
+    "A session lives as long as the connection that made it: of its own, this command makes a "
+    "connection and ends it. Use 'halvoxctl run' or 'halvoxctl shell' for commands that belong "
+    "together.";
+
+constexpr const char* kScriptNote =
+    "The lines are as the arguments of halvoxctl, quoted as in a shell; a JSON object at the end "
+    "of "
+    "a line needs no quotes. # begins a comment.\nBesides the requests there are 'wait ID "
+    "[SECONDS]' (for the answer to a start) and 'sleep SECONDS'.\nEnds at the first line that "
+    "fails, with its status.";
+
+constexpr const char* kExitStatusNote =
+    "Exit status: 0 done, 1 the service said no, 2 bad arguments, 69 no service or no store, "
+    "74 the output cannot be written, 78 bad configuration.";
+
+double secondsSince1970() {
+  return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+}
+
+Parsed<double> parseTimeNow(std::string_view text) { return parseTime(text, secondsSince1970()); }
+
+// Builds the parser for one command line and holds what it reads. Exceptions are the parsing
+// library's own way to report; none leaves parse().
+class CommandLineParser {
+ public:
+  CommandLineParser(CommandSource source, std::istream& input) : source_(source), input_(input) {
+    app_.name(source == CommandSource::kArguments ? "halvoxctl" : "");
+    app_.description("Talks to the Halvox reporting service.");
+    app_.require_subcommand(1);
+    // Built by hand: the library's own text for bad arguments repeats the whole usage.
+    app_.footer(kExitStatusNote);
+    addSessionRequests();
+    addMessageRequest();
+    addQueries();
+    if (source == CommandSource::kArguments) {
+      app_.set_version_flag("--version", std::string("halvoxctl ") + kHalvoxVersion);
+      addConnectionOptions(app_);
+      addScripts();
+      addEvents();
+    } else {
+      addScriptRequests();
+    }
+  }
+
+  std::variant<Command, CommandLineText> parse(std::vector<std::string> arguments) {
+    std::ranges::reverse(arguments);  // as the library wants them
+    try {
+      app_.parse(std::move(arguments));
+    } catch (const CLI::CallForHelp&) {
+      return CommandLineText{ExitStatus::kDone, helpOf(app_)};
+    } catch (const CLI::CallForVersion& version) {
+      return CommandLineText{ExitStatus::kDone, std::string(version.what()) + "\n"};
+    } catch (const CLI::ParseError& error) {
+      return CommandLineText{ExitStatus::kBadArguments, describe(error)};
+    }
+    return std::move(command_);
+  }
+
+ private:
+  // An argument or option whose text one of the functions above understands.
+  template <typename T, typename Target>
+  CLI::Option* add(CLI::App& app, const std::string& name, Target& target,
+                   Parsed<T> (*parseText)(std::string_view), const std::string& description) {
+    const std::string shown = name.substr(name.rfind(',') + 1);
+    return app.add_option_function<std::string>(
+        name,
+        [&target, parseText, shown](const std::string& text) {
+          auto parsed = parseText(text);
+          if (const auto* error = std::get_if<ArgumentError>(&parsed)) {
+            throw CLI::ValidationError(shown, error->message);
+          }
+          target = std::move(std::get<T>(parsed));
+        },
+        description);
+  }
+
+  // `summary` is the line in the list of commands; `details` stand in the command's own help only.
+  CLI::App& addCommand(const char* name, const char* summary, const std::string& example,
+                       const std::string& details = "") {
+    CLI::App* app = app_.add_subcommand(name, summary);
+    addConnectionOptions(*app);
+    app->footer((details.empty() ? "" : details + "\n\n") + "Example:\n  " + example);
+    return *app;
+  }
+
+  // Every command has these, and the program before the command too.
+  void addConnectionOptions(CLI::App& app) {
+    app.add_flag("--json", command_.options.json, "Print JSON, one object a line");
+    if (source_ == CommandSource::kScriptLine) return;
+    app.add_option("--socket", command_.options.socket,
+                   "The service's socket (default: $HALVOX_SOCKET, else "
+                   "$XDG_RUNTIME_DIR/halvox/reporting.sock, else /run/halvox/reporting.sock)")
+        ->type_name("PATH");
+    add(app, "--timeout", command_.options.timeout, parseSeconds,
+        "How long to wait for an answer (default: 5)")
+        ->type_name("SECONDS");
+  }
+
+  CLI::Option* addID(CLI::App& app) {
+    return add(app, "ID", id_, parseReporterID, "The session's reporter ID")->required();
+  }
+
+  void addJson(CLI::App& app, const char* what) {
+    app.add_option_function<std::string>(
+           "JSON",
+           [this](const std::string& text) {
+             auto parsed = parseDictionary(text == "-" ? readInput() : text);
+             if (const auto* error = std::get_if<ArgumentError>(&parsed)) {
+               throw CLI::ValidationError("JSON", error->message);
+             }
+             dictionary_ = std::get<Dictionary>(parsed);
+           },
+           std::string(what) + " as a JSON object; \"-\" reads standard input")
+        ->required();
+  }
+
+  std::string readInput() {
+    if (source_ == CommandSource::kScriptLine) {
+      throw CLI::ValidationError("JSON", "\"-\" is for single commands; in a script, write it out");
+    }
+    return {std::istreambuf_iterator<char>(input_), {}};
+  }
+
+  template <typename Make>
+  void onRun(CLI::App& app, Make make) {
+    app.callback([this, make] { command_.what = make(); });
+  }
+
+  void addSessionRequests();
+  void addMessageRequest();
+  void addQueries();
+  void addScriptRequests();
+  void addScripts();
+  void addEvents();
+  [[nodiscard]] Send makeSend() const;
+  static std::string helpOf(const CLI::App& app);
+  [[nodiscard]] std::string describe(const CLI::ParseError& error) const;
+  [[nodiscard]] std::string listCommands() const;
+
+  CommandSource source_;
+  std::istream& input_;
+  CLI::App app_;
+  Command command_;
+  // What single arguments come to, for the command that is then made of them.
+  ReporterID id_ = 0;
+  ServiceType serviceType_ = 0;
+  Category category_ = 0;
+  EventType eventType_ = 0;
+  Dictionary dictionary_;
+  std::vector<ReporterID> ids_;
+  bool toAll_ = false;
+  bool isWaiting_ = false;
+  std::optional<std::chrono::milliseconds> time_;
+  RunScript script_;
+  ShowEvents events_;
+};
+
+void CommandLineParser::addSessionRequests() {
+  auto& create = addCommand("create", "Create a session", "halvoxctl create 7", kSessionNote);
+  addID(create);
+  onRun(create, [this] { return Create{id_}; });
+
+  auto& setType =
+      addCommand("set-type", "Set a session's service type", "halvoxctl set-type 7 telephony");
+  addID(setType);
+  add(setType, "TYPE", serviceType_, parseServiceType, "A service type: name or number")
+      ->required();
+  onRun(setType, [this] { return SetType{id_, serviceType_}; });
+
+  auto& configure =
+      addCommand("configure", "Merge a dictionary into a session's configuration",
+                 "halvoxctl configure 7 '{\"HostApplicationDisplayID\": \"org.example.player\"}'");
+  addID(configure);
+  addJson(configure, "The configuration");
+  onRun(configure, [this] { return Configure{id_, dictionary_}; });
+
+  auto& start = addCommand("start", "Start a session", "halvoxctl start 7 --wait 10");
+  addID(start);
+  // A wait without a number waits as long as for any answer.
+  start
+      .add_option_function<std::vector<std::string>>(
+          "--wait",
+          [this](const std::vector<std::string>& texts) {
+            isWaiting_ = true;
+            if (texts.empty() || texts.front().empty()) return;
+            const auto parsed = parseSeconds(texts.front());
+            if (const auto* error = std::get_if<ArgumentError>(&parsed)) {
+              throw CLI::ValidationError("--wait", error->message);
+            }
+            time_ = std::get<std::chrono::milliseconds>(parsed);
+          },
+          "Wait for the service's answer, which it holds back until the session "
+          "is stopped; without a number, as long as --timeout says")
+      ->expected(0, 1)
+      ->type_name("SECONDS");
+  onRun(start, [this] {
+    if (!isWaiting_) return Start{id_, std::nullopt};
+    return Start{id_, time_.value_or(command_.options.timeout)};
+  });
+
+  auto& stop = addCommand("stop", "Stop a session", "halvoxctl stop 7");
+  addID(stop);
+  onRun(stop, [this] { return Stop{id_}; });
+
+  auto& destroy = addCommand("destroy", "Destroy a session", "halvoxctl destroy 7");
+  addID(destroy);
+  onRun(destroy, [this] { return Destroy{id_}; });
+}
+
+void CommandLineParser::addMessageRequest() {
+  auto& send = addCommand("send", "Send a message to sessions, its own and those of others",
+                          "halvoxctl send --id 7 --category Session_Playback --type Start "
+                          "'{\"sample_rate\": 48000}'");
+  send.add_option_function<std::vector<std::string>>(
+          "--id",
+          [this](const std::vector<std::string>& texts) {
+            for (const auto& text : texts) {
+              const auto parsed = parseReporterID(text);
+              if (const auto* error = std::get_if<ArgumentError>(&parsed)) {
+                throw CLI::ValidationError("--id", error->message);
+              }
+              ids_.push_back(std::get<ReporterID>(parsed));
+            }
+          },
+          "A session that the message is for; may be given several times")
+      ->type_name("ID")
+      ->expected(1)
+      ->take_all();
+  send.add_flag("--all", toAll_, "The message is for all active sessions");
+  add(send, "--category", category_, parseCategory, "Name or number, such as Session_Playback")
+      ->type_name("CATEGORY")
+      ->required();
+  add(send, "--type", eventType_, parseEventType, "Name or number, such as Start")
+      ->type_name("TYPE")
+      ->required();
+  addJson(send, "The message");
+  onRun(send, [this] { return makeSend(); });
+}
+
+Send CommandLineParser::makeSend() const {
+  if (toAll_ == !ids_.empty()) {
+    throw CLI::ValidationError(
+        "--id", toAll_ ? "goes with no --all; expected one of the two"
+                       : "is missing; expected --id ID for some sessions or --all for the active");
+  }
+  Send send{.ids = {}, .category = category_, .type = eventType_, .message = dictionary_};
+  if (!toAll_) send.ids = ids_;
+  return send;
+}
+
+void CommandLineParser::addQueries() {
+  auto& type = addCommand("type", "Show a session's service type", "halvoxctl type 7");
+  addID(type);
+  onRun(type, [this] { return GetType{id_}; });
+
+  auto& valid = addCommand("valid", "Show whether a session exists; exit status 1 when it does not",
+                           "halvoxctl valid 7 && echo there");
+  addID(valid);
+  onRun(valid, [this] { return Valid{id_}; });
+
+  auto& list = addCommand("list", "List the reporter IDs of all sessions", "halvoxctl list --json");
+  onRun(list, [] { return List{}; });
+
+  auto& kill = addCommand("kill", "End the service at once, without an answer or any tidying up",
+                          "halvoxctl kill");
+  onRun(kill, [] { return Kill{}; });
+}
+
+void CommandLineParser::addScriptRequests() {
+  auto& wait =
+      addCommand("wait", "Wait for the answer to the last start of a session", "wait 7 10");
+  addID(wait);
+  add(wait, "SECONDS", time_, parseSeconds, "How long at most (default: the time-out)");
+  onRun(wait, [this] { return WaitForStart{id_, time_.value_or(std::chrono::milliseconds(0))}; });
+
+  auto& sleep = addCommand("sleep", "Let time pass with the connection open", "sleep 0.5");
+  add(sleep, "SECONDS", time_, parseSeconds, "How long")->required();
+  onRun(sleep, [this] { return Sleep{time_.value_or(std::chrono::milliseconds(0))}; });
+}
+
+void CommandLineParser::addScripts() {
+  auto& run = addCommand("run", "Carry out a file of commands, one a line, over one connection",
+                         "printf 'create 7\\nstart 7\\nstop 7\\n' | halvoxctl run -", kScriptNote);
+  run.add_option("FILE", script_.file, "The file; \"-\" reads standard input")->required();
+  run.add_flag("--keep-going", script_.keepGoing, "Go on behind lines that fail");
+  onRun(run, [this] { return script_; });
+
+  auto& shell =
+      addCommand("shell", "Read commands as you type them, over one connection", "halvoxctl shell",
+                 "Sessions live until you leave. 'help' lists the commands, 'quit' or the "
+                 "end of the input leaves.");
+  onRun(shell, [] { return RunShell{}; });
+}
+
+void CommandLineParser::addEvents() {
+  auto& events = addCommand("events", "Show the events that the service stored, newest last",
+                            "halvoxctl events --name 'com.tarno.*' --since 5m --follow");
+  events
+      .add_option("--name", events_.names,
+                  "Only events of names that match this glob pattern; may be given several times")
+      ->type_name("GLOB")
+      ->expected(1)
+      ->take_all();
+  add(events, "--since", events_.since, parseTimeNow,
+      "Only events since then: a date (RFC 3339), seconds since 1970, or an age (90s, 5m, 2h, 3d)")
+      ->type_name("TIME");
+  add(events, "--until", events_.until, parseTimeNow, "Only events before then")->type_name("TIME");
+  events.add_option("--last", events_.last, "Only so many, the newest")
+      ->type_name("N")
+      ->check(CLI::NonNegativeNumber);
+  events.add_flag("--follow", events_.follow,
+                  "Go on showing events as they come; begins with the last 10 unless --since or "
+                  "--last say otherwise");
+  events
+      .add_option("--database", events_.database,
+                  "The store: a halvox.db or its directory (default: where the service's "
+                  "configuration puts it)")
+      ->type_name("FILE");
+  onRun(events, [this] { return events_; });
+}
+
+std::string CommandLineParser::helpOf(const CLI::App& app) {
+  const auto chosen = app.get_subcommands();
+  return chosen.empty() ? app.help() : chosen.front()->help("halvoxctl");
+}
+
+// "halvoxctl send: --type: …": which command, which argument, what is wrong with it.
+std::string CommandLineParser::describe(const CLI::ParseError& error) const {
+  std::string prefix = app_.get_name();
+  const auto chosen = app_.get_subcommands();
+  const auto rest = app_.remaining();
+  if (!chosen.empty()) prefix += (prefix.empty() ? "" : " ") + chosen.front()->get_name();
+  std::string text = prefix.empty() ? "" : prefix + ": ";
+  if (chosen.empty() && !rest.empty()) {
+    text +=
+        "there is no command \"" + harmlessText(rest.front()) + "\"; expected " + listCommands();
+  } else {
+    text += harmlessText(error.what());
+  }
+  text += '\n';
+  if (source_ == CommandSource::kArguments) text += "Try '" + prefix + " --help'.\n";
+  return text;
+}
+
+std::string CommandLineParser::listCommands() const {
+  std::string list;
+  for (const auto* command : app_.get_subcommands([](const CLI::App*) { return true; })) {
+    list += (list.empty() ? "" : ", ") + command->get_name();
+  }
+  return list;
+}
+
+}  // namespace
+
+std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string> arguments,
+                                                        CommandSource source, std::istream& input) {
+  CommandLineParser parser(source, input);
+  return parser.parse(std::move(arguments));
+}
+
+}  // namespace halvox::tools

@@ -1,0 +1,206 @@
+#include "tools/Events.h"
+
+#include <atomic>
+#include <cstdlib>
+#include <ctime>
+#include <fstream>
+#include <memory>
+#include <sstream>
+#include <string>
+#include <thread>
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include "client/TestService.h"
+#include "platform/fake/FakePlatform.h"
+#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/store/SqliteAnalyticsService.h"
+#include "platform/linux/store/SqliteStore.h"
+
+namespace halvox::tools {
+namespace {
+
+using platform::linux_::Backpressure;
+using platform::linux_::SqliteAnalyticsService;
+using platform::linux_::SqliteStore;
+using platform::linux_::StoredEvent;
+using platform::linux_::StoreOptions;
+using platform::linux_::UniqueFd;
+
+// Writes events into a store of its own: one a second, from 100 seconds after 1970 on.
+class EventsTest : public testing::Test {
+ protected:
+  EventsTest() {
+    setenv("TZ", "UTC", 1);
+    tzset();
+    StoreOptions options;
+    options.directory = scratch_.path("state");
+    options.retentionDays = 1'000'000;  // these events are old
+    store_ = std::make_unique<SqliteStore>(
+        options, SqliteStore::Environment{platform_.clock, platform_.statistics, backpressure_});
+    EXPECT_FALSE(store_->open());
+    service_ = std::make_unique<SqliteAnalyticsService>(*store_, platform_.clock);
+  }
+
+  void store(const std::string& name, const platform::Dictionary& payload) {
+    platform_.clock.setCurrentDate({time_++});
+    service_->sendAnalyticsEventLazy(name, [payload] { return payload; });
+    EXPECT_TRUE(client::eventually([this] { return store_->waiting() == 0; }));
+  }
+  void storeSome() {
+    store("com.a.first", {{"n", 1}});
+    store("com.b.second", {{"n", 2}});
+    store("com.a.third", {{"n", 3}});
+    store("com.c.fourth", {{"n", 4}});
+  }
+  // The field n of the events shown, in their order.
+  std::string shown(ShowEvents request) {
+    request.database = scratch_.path("state");
+    std::ostringstream out;
+    EXPECT_EQ(showEvents(request, EventForm::kText, out, -1, errors_), ExitStatus::kDone);
+    std::string numbers;
+    std::istringstream lines(out.str());
+    for (std::string line; std::getline(lines, line);) numbers += line.substr(line.find("n=") + 2);
+    return numbers;
+  }
+
+  client::ScratchDirectory scratch_;
+  platform::FakePlatform platform_;
+  Backpressure backpressure_;
+  std::unique_ptr<SqliteStore> store_;
+  std::unique_ptr<SqliteAnalyticsService> service_;
+  std::ostringstream errors_;
+  double time_ = 100;
+};
+
+TEST_F(EventsTest, ShowsEventsNewestLast) {
+  storeSome();
+
+  EXPECT_EQ(shown({}), "1234");
+}
+
+TEST_F(EventsTest, ChoosesByNameAndTime) {
+  storeSome();
+
+  EXPECT_EQ(shown({.names = {"com.a.*"}}), "13");
+  EXPECT_EQ(shown({.names = {"com.a.*", "*fourth"}}), "134");
+  EXPECT_EQ(shown({.since = 101}), "234");
+  EXPECT_EQ(shown({.until = 102}), "12");
+  EXPECT_EQ(shown({.names = {"nothing"}}), "");
+}
+
+TEST_F(EventsTest, TheLastAreCountedAfterTheChoice) {
+  storeSome();
+
+  EXPECT_EQ(shown({.last = 2}), "34");
+  EXPECT_EQ(shown({.names = {"com.a.*"}, .last = 1}), "3");
+  EXPECT_EQ(shown({.names = {"com.a.*", "com.b.*"}, .last = 2}), "23");
+  EXPECT_EQ(shown({.names = {"com.a.*", "com.b.*"}, .last = 0}), "");
+}
+
+TEST_F(EventsTest, JsonHasTimeNameAndPayload) {
+  store("com.a.first", {{"n", 1}, {"text", "\x1B[2J"}});
+  ShowEvents request;
+  request.database = scratch_.path("state/halvox.db");
+  std::ostringstream out;
+
+  EXPECT_EQ(showEvents(request, EventForm::kJson, out, -1, errors_), ExitStatus::kDone);
+
+  EXPECT_EQ(out.str().substr(0, 44), "{\"time\":100.0,\"name\":\"com.a.first\",\"payload\"");
+  EXPECT_EQ(out.str().find('\x1B'), std::string::npos);
+}
+
+TEST_F(EventsTest, AStoreThatIsNotThereIsNoService) {
+  ShowEvents request;
+  request.database = scratch_.path("elsewhere/halvox.db");
+  std::ostringstream out;
+
+  EXPECT_EQ(showEvents(request, EventForm::kText, out, -1, errors_), ExitStatus::kNoService);
+  EXPECT_NE(errors_.str().find("elsewhere"), std::string::npos);
+}
+
+TEST_F(EventsTest, AnyOtherFileIsABadArgument) {
+  ShowEvents request;
+  request.database = scratch_.path("state/other.db");
+  std::ostringstream out;
+
+  EXPECT_EQ(showEvents(request, EventForm::kText, out, -1, errors_), ExitStatus::kBadArguments);
+}
+
+TEST_F(EventsTest, ABadConfigurationHasItsOwnStatus) {
+  const std::string configuration = scratch_.path("halvox.toml");
+  std::ofstream(configuration) << "[storage]\ndirectory = 5\n";
+  setenv("HALVOX_CONFIG", configuration.c_str(), 1);
+  std::ostringstream out;
+
+  EXPECT_EQ(showEvents({}, EventForm::kText, out, -1, errors_), ExitStatus::kBadConfiguration);
+
+  unsetenv("HALVOX_CONFIG");
+}
+
+TEST_F(EventsTest, TheConfigurationNamesTheStore) {
+  store("com.a.first", {{"n", 1}});
+  const std::string configuration = scratch_.path("halvox.toml");
+  std::ofstream(configuration) << "[storage]\ndirectory = \"" << scratch_.path("state") << "\"\n";
+  setenv("HALVOX_CONFIG", configuration.c_str(), 1);
+  std::ostringstream out;
+
+  EXPECT_EQ(showEvents({}, EventForm::kText, out, -1, errors_), ExitStatus::kDone);
+  EXPECT_NE(out.str().find("com.a.first"), std::string::npos);
+
+  unsetenv("HALVOX_CONFIG");
+}
+
+// Follows through a pipe, as another program would: its lines are read at this end.
+TEST_F(EventsTest, FollowingShowsWhatComesUntilNobodyReads) {
+  store("com.a.first", {{"n", 1}});
+  const std::string pipePath = scratch_.path("pipe");
+  ASSERT_EQ(mkfifo(pipePath.c_str(), 0600), 0);
+  UniqueFd readEnd(open(pipePath.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
+  UniqueFd writeEnd(open(pipePath.c_str(), O_WRONLY | O_CLOEXEC));
+  std::atomic<int> status{-1};
+  std::jthread follower([&] {
+    std::ofstream out(pipePath);
+    ShowEvents request;
+    request.follow = true;
+    request.database = scratch_.path("state");
+    status = static_cast<int>(showEvents(request, EventForm::kText, out, writeEnd.get(), errors_));
+  });
+
+  std::string seen;
+  const auto hasSeen = [&](const char* text) {
+    char buffer[4096];
+    const ssize_t size = read(readEnd.get(), buffer, sizeof buffer);
+    if (size > 0) seen.append(buffer, static_cast<std::size_t>(size));
+    return seen.find(text) != std::string::npos;
+  };
+  EXPECT_TRUE(client::eventually([&] { return hasSeen("n=1"); }));
+  store("com.a.second", {{"n", 2}});
+  EXPECT_TRUE(client::eventually([&] { return hasSeen("n=2"); }));
+  readEnd.reset();
+
+  EXPECT_TRUE(client::eventually([&] { return status == 0; }));
+}
+
+TEST(FormatEventTest, TextIsOneLineWithLocalTimeNameAndFields) {
+  setenv("TZ", "UTC", 1);
+  tzset();
+
+  EXPECT_EQ(formatEvent({1, 86'400.25, "com.tarno.test", R"({"a":1,"b":"x y"})"}, EventForm::kText),
+            "1970-01-02 00:00:00.250  com.tarno.test  a=1 b=\"x y\"");
+}
+
+TEST(FormatEventTest, NothingThatAClientSentDrivesTheTerminal) {
+  const StoredEvent event{1, 0, "evil\x1B[2J\xC2\x9B", "{\"k\":\"\xC2\x9B\x7F\"}"};
+
+  for (const auto form : {EventForm::kText, EventForm::kJson}) {
+    const std::string line = formatEvent(event, form);
+    EXPECT_EQ(line.find_first_of("\x1B\x7F\n"), std::string::npos);
+    EXPECT_EQ(line.find("\xC2\x9B"), std::string::npos);
+  }
+}
+
+}  // namespace
+}  // namespace halvox::tools

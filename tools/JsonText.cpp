@@ -1,0 +1,288 @@
+#include "tools/JsonText.h"
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+#include <cstdint>
+#include <cstdio>
+#include <ctime>
+#include <limits>
+#include <vector>
+
+#include <rapidjson/document.h>
+#include <rapidjson/error/en.h>
+#include <rapidjson/stringbuffer.h>
+#include <rapidjson/writer.h>
+
+#include "platform/linux/runtime/Utf8.h"
+
+namespace halvox::tools {
+namespace {
+
+using platform::Array;
+using platform::Dictionary;
+using platform::Value;
+using Writer = rapidjson::Writer<rapidjson::StringBuffer>;
+
+// What the wire can hold at most: a dictionary is a level of its own and one of the variant in it.
+constexpr int kMaxDepth = 32;
+constexpr unsigned kParseFlags = rapidjson::kParseFullPrecisionFlag |
+                                 rapidjson::kParseIterativeFlag |
+                                 rapidjson::kParseValidateEncodingFlag;
+
+std::string_view textOf(const rapidjson::Value& value) {
+  return {value.GetString(), value.GetStringLength()};
+}
+
+// Turns parsed JSON into values, and remembers where it was when it could not.
+class Converter {
+ public:
+  bool convert(const rapidjson::Value& json, Dictionary& dictionary) {
+    if (++depth_ > kMaxDepth) return fail("nested too deep");
+    dictionary.reserve(json.MemberCount());
+    for (const auto& member : json.GetObject()) {
+      const std::size_t length = path_.size();
+      path_.append(length > 0 ? "." : "").append(textOf(member.name));
+      if (dictionary.contains(textOf(member.name))) return fail("the key occurs twice");
+      Value value;
+      if (!convert(member.value, value)) return false;
+      dictionary.set(textOf(member.name), std::move(value));
+      path_.resize(length);
+    }
+    --depth_;
+    return true;
+  }
+
+  [[nodiscard]] ArgumentError error() const { return {"\"" + path_ + "\": " + reason_}; }
+
+ private:
+  bool fail(const char* reason) {
+    reason_ = reason;
+    return false;
+  }
+
+  bool convert(const rapidjson::Value& json, Value& value) {
+    switch (json.GetType()) {
+      case rapidjson::kNullType:
+        return fail("null has no form in a message; leave the key out");
+      case rapidjson::kFalseType:
+      case rapidjson::kTrueType:
+        value = json.GetBool();
+        return true;
+      case rapidjson::kStringType:
+        if (textOf(json).find('\0') != std::string_view::npos) {
+          return fail("a NUL character has no form in a message");
+        }
+        value = textOf(json);
+        return true;
+      case rapidjson::kNumberType:
+        value = number(json);
+        return true;
+      case rapidjson::kArrayType:
+        return convertArray(json, value);
+      case rapidjson::kObjectType: {
+        Dictionary dictionary;
+        if (!convert(json, dictionary)) return false;
+        value = dictionary;
+        return true;
+      }
+    }
+    return fail("of an unknown kind");
+  }
+
+  static Value number(const rapidjson::Value& json) {
+    if (json.IsInt64()) return json.GetInt64();
+    if (json.IsUint64()) return json.GetUint64();
+    return json.GetDouble();
+  }
+
+  bool convertArray(const rapidjson::Value& json, Value& value) {
+    if (++depth_ > kMaxDepth) return fail("nested too deep");
+    std::vector<Value> values;
+    for (const auto& element : json.GetArray()) {
+      const std::size_t length = path_.size();
+      path_.append("[").append(std::to_string(values.size())).append("]");
+      if (!convert(element, values.emplace_back())) return false;
+      path_.resize(length);
+    }
+    value = Array(values);
+    --depth_;
+    return true;
+  }
+
+  int depth_ = 0;
+  std::string path_;
+  std::string reason_;
+};
+
+void write(Writer& writer, std::string_view text) {
+  writer.String(text.data(), static_cast<rapidjson::SizeType>(text.size()));
+}
+
+void writeDouble(Writer& writer, double number) {
+  if (std::isfinite(number)) {
+    writer.Double(number);
+  } else if (std::isnan(number)) {
+    writer.String("NaN");
+  } else {
+    writer.String(number > 0 ? "Infinity" : "-Infinity");
+  }
+}
+
+void writeNumber(Writer& writer, const Value& value) {
+  switch (value.numberKind()) {
+    case platform::NumberKind::kBool:
+      writer.Bool(value.toBool());
+      break;
+    case platform::NumberKind::kUInt8:
+    case platform::NumberKind::kUInt16:
+    case platform::NumberKind::kUInt32:
+    case platform::NumberKind::kUInt64:
+      writer.Uint64(value.toUInt64());
+      break;
+    case platform::NumberKind::kInt16:
+    case platform::NumberKind::kInt32:
+    case platform::NumberKind::kInt64:
+      writer.Int64(value.toInt64());
+      break;
+    case platform::NumberKind::kFloat:
+    case platform::NumberKind::kDouble:
+      writeDouble(writer, value.toDouble());
+      break;
+  }
+}
+
+void write(Writer& writer, const Value& value) {
+  switch (value.kind()) {
+    case platform::ValueKind::kNone:
+      writer.Null();
+      break;
+    case platform::ValueKind::kNumber:
+      writeNumber(writer, value);
+      break;
+    case platform::ValueKind::kString:
+      write(writer, value.string());
+      break;
+    case platform::ValueKind::kDate:
+    case platform::ValueKind::kData:
+      write(writer, std::string_view(platform::describe(value)));
+      break;
+    case platform::ValueKind::kArray: {
+      writer.StartArray();
+      const Array array = value.array();
+      for (const Value& element : array) write(writer, element);
+      writer.EndArray();
+      break;
+    }
+    case platform::ValueKind::kDictionary: {
+      writer.StartObject();
+      const Dictionary dictionary = value.dictionary();
+      for (const auto& entry : dictionary) {
+        const auto key = entry.key.text();
+        writer.Key(key.data(), static_cast<rapidjson::SizeType>(key.size()));
+        write(writer, entry.value);
+      }
+      writer.EndObject();
+      break;
+    }
+  }
+}
+
+// Characters that a terminal acts upon, or that make a line look like another one.
+bool isHarmful(char32_t character) {
+  const bool isControl = character < 0x20 || (character >= 0x7F && character <= 0x9F);
+  const bool isSeparator = character == 0x2028 || character == 0x2029;
+  const bool reorders = (character >= 0x202A && character <= 0x202E) ||
+                        (character >= 0x2066 && character <= 0x2069) || character == 0x200E ||
+                        character == 0x200F || character == 0x061C;
+  return isControl || isSeparator || reorders;
+}
+
+void appendEscape(std::string& result, const char* format, unsigned number) {
+  std::array<char, 16> escape{};
+  std::snprintf(escape.data(), escape.size(), format, number);
+  result += escape.data();
+}
+
+enum class InvalidByte : std::uint8_t { kReplaced, kShown };
+
+std::string harmless(std::string_view text, InvalidByte treatment) {
+  std::string result;
+  result.reserve(text.size());
+  while (!text.empty()) {
+    const auto step = platform::linux_::nextUtf8(text);
+    if (step.valid && !isHarmful(step.character)) {
+      result += text.substr(0, step.length);
+    } else if (step.valid) {
+      appendEscape(result, "\\u%04x", static_cast<unsigned>(step.character));
+    } else if (treatment == InvalidByte::kShown) {
+      appendEscape(result, "\\x%02x", static_cast<unsigned char>(text.front()));
+    } else {
+      result += "\uFFFD";
+    }
+    text.remove_prefix(step.length);
+  }
+  return result;
+}
+
+bool canStandWithoutQuotes(std::string_view text) {
+  return !text.empty() && text.find_first_of(" \"'=\\{}[],") == std::string_view::npos;
+}
+
+std::string compact(const rapidjson::Value& json) {
+  rapidjson::StringBuffer buffer;
+  Writer writer(buffer);
+  json.Accept(writer);
+  return {buffer.GetString(), buffer.GetSize()};
+}
+
+}  // namespace
+
+Parsed<Dictionary> parseDictionary(std::string_view json) {
+  rapidjson::Document document;
+  document.Parse<kParseFlags>(json.data(), json.size());
+  if (document.HasParseError()) {
+    return ArgumentError{"no JSON: at byte " + std::to_string(document.GetErrorOffset() + 1) +
+                         ": " + rapidjson::GetParseError_En(document.GetParseError())};
+  }
+  if (!document.IsObject()) {
+    return ArgumentError{"expected a JSON object, such as {\"sample_rate\": 48000}"};
+  }
+  Converter converter;
+  Dictionary dictionary;
+  if (!converter.convert(document, dictionary)) return converter.error();
+  return dictionary;
+}
+
+std::string toJson(const Value& value) {
+  rapidjson::StringBuffer buffer;
+  Writer writer(buffer);
+  write(writer, value);
+  return {buffer.GetString(), buffer.GetSize()};
+}
+
+std::string quoted(std::string_view text) {
+  return toJson(Value(platform::linux_::replaceInvalidUtf8(text)));
+}
+
+std::string harmlessJson(std::string_view json) { return harmless(json, InvalidByte::kReplaced); }
+
+std::string harmlessText(std::string_view text) { return harmless(text, InvalidByte::kShown); }
+
+std::string fieldsOfJson(std::string_view json) {
+  rapidjson::Document document;
+  document.Parse<kParseFlags>(json.data(), json.size());
+  if (document.HasParseError() || !document.IsObject()) return harmlessText(json);
+  std::string fields;
+  for (const auto& member : document.GetObject()) {
+    if (!fields.empty()) fields += ' ';
+    const auto key = textOf(member.name);
+    fields += canStandWithoutQuotes(key) ? harmlessText(key) : harmlessJson(compact(member.name));
+    fields += '=';
+    const bool isPlain = member.value.IsString() && canStandWithoutQuotes(textOf(member.value));
+    fields += isPlain ? harmlessText(textOf(member.value)) : harmlessJson(compact(member.value));
+  }
+  return fields;
+}
+
+}  // namespace halvox::tools

@@ -1,0 +1,131 @@
+#include "tools/JsonText.h"
+
+#include <cmath>
+#include <limits>
+#include <string>
+
+#include <gtest/gtest.h>
+
+namespace halvox::tools {
+namespace {
+
+using platform::Array;
+using platform::Dictionary;
+using platform::NumberKind;
+using platform::Value;
+
+Dictionary dictionaryOf(std::string_view json) {
+  const auto parsed = parseDictionary(json);
+  if (const auto* error = std::get_if<ArgumentError>(&parsed)) {
+    ADD_FAILURE() << error->message;
+    return {};
+  }
+  return std::get<Dictionary>(parsed);
+}
+
+std::string errorOf(std::string_view json) {
+  const auto parsed = parseDictionary(json);
+  const auto* error = std::get_if<ArgumentError>(&parsed);
+  return error != nullptr ? error->message : "";
+}
+
+std::string nested(std::size_t levels) {
+  std::string json;
+  for (std::size_t level = 0; level < levels; ++level) json += "{\"d\":";
+  return json + "1" + std::string(levels, '}');
+}
+
+TEST(JsonTextTest, ObjectsBecomeDictionaries) {
+  EXPECT_EQ(dictionaryOf(R"({"a": 1, "b": {"c": [true, "text", 2.5]}, "d": {}, "e": []})"),
+            (Dictionary{{"a", 1},
+                        {"b", Dictionary{{"c", Array{true, "text", 2.5}}}},
+                        {"d", Dictionary{}},
+                        {"e", Array{}}}));
+}
+
+TEST(JsonTextTest, WholeNumbersKeepTheir64Bits) {
+  const auto numbers = dictionaryOf(
+      R"({"least": -9223372036854775808, "most": 18446744073709551615, "real": 1.0, "yes": true})");
+
+  EXPECT_EQ(numbers.find("least")->numberKind(), NumberKind::kInt64);
+  EXPECT_EQ(numbers.find("least")->toInt64(), std::numeric_limits<std::int64_t>::min());
+  EXPECT_EQ(numbers.find("most")->numberKind(), NumberKind::kUInt64);
+  EXPECT_EQ(numbers.find("most")->toUInt64(), std::numeric_limits<std::uint64_t>::max());
+  EXPECT_EQ(numbers.find("real")->numberKind(), NumberKind::kDouble);
+  EXPECT_EQ(numbers.find("yes")->numberKind(), NumberKind::kBool);
+}
+
+TEST(JsonTextTest, RefusesNullAndNamesItsPlace) {
+  EXPECT_EQ(errorOf(R"({"a": {"b": [1, null]}})"),
+            "\"a.b[1]\": null has no form in a message; leave the key out");
+}
+
+TEST(JsonTextTest, RefusesAKeyThatOccursTwice) {
+  EXPECT_EQ(errorOf(R"({"x": {"a": 1, "a": 2}})"), "\"x.a\": the key occurs twice");
+}
+
+TEST(JsonTextTest, SaysWhereTextIsNoJson) {
+  EXPECT_EQ(errorOf(R"({"a": 1,})").substr(0, 20), "no JSON: at byte 9: ");
+  EXPECT_NE(errorOf(""), "");
+  EXPECT_NE(errorOf(R"({"a": 1} x)"), "");
+  EXPECT_NE(errorOf("{\"a\": \"\xFF\"}"), "");
+  EXPECT_NE(errorOf(R"({"a": NaN})"), "");
+  EXPECT_NE(errorOf(R"({"a": 1e999})"), "");
+}
+
+TEST(JsonTextTest, RefusesAnythingButAnObject) {
+  EXPECT_EQ(errorOf("[1]"), "expected a JSON object, such as {\"sample_rate\": 48000}");
+}
+
+TEST(JsonTextTest, RefusesANulInAText) {
+  EXPECT_EQ(errorOf(R"({"a": "x\u0000y"})"), "\"a\": a NUL character has no form in a message");
+}
+
+TEST(JsonTextTest, NestsAsDeepAsAMessageMay) {
+  EXPECT_EQ(errorOf(nested(32)), "");
+  EXPECT_NE(errorOf(nested(33)).find("nested too deep"), std::string::npos);
+  EXPECT_NE(errorOf(nested(100'000)).find("nested too deep"), std::string::npos);
+}
+
+TEST(JsonTextTest, ValuesBecomeJson) {
+  EXPECT_EQ(toJson(Dictionary{{"a", Array{1, 2.5, true, "x\"y"}}, {"b", Dictionary{}}}),
+            R"({"a":[1,2.5,true,"x\"y"],"b":{}})");
+  EXPECT_EQ(toJson(Array{std::nan(""), HUGE_VAL, -HUGE_VAL}), R"(["NaN","Infinity","-Infinity"])");
+  EXPECT_EQ(toJson(Array{INT64_MIN, UINT64_MAX}), "[-9223372036854775808,18446744073709551615]");
+}
+
+TEST(JsonTextTest, TextForATerminalHasNoControlCharacters) {
+  EXPECT_EQ(harmlessText("a\x1B[31mb\nc\x7F\xC2\x9B"
+                         "2J\xFF\xE2\x80\xAE!"),
+            "a\\u001b[31mb\\u000ac\\u007f\\u009b2J\\xff\\u202e!");
+  EXPECT_EQ(harmlessText("gr\xC3\xBC\xC3\x9F \xF0\x9F\x8E\xA7"),
+            "gr\xC3\xBC\xC3\x9F \xF0\x9F\x8E\xA7");
+}
+
+TEST(JsonTextTest, JsonForATerminalStaysTheSameJson) {
+  const std::string json = harmlessJson("{\"a\":\"\xC2\x9B\x7F\"}");
+
+  EXPECT_EQ(json, R"({"a":"\u009b\u007f"})");
+  EXPECT_EQ(dictionaryOf(json), dictionaryOf("{\"a\":\"\xC2\x9B\x7F\"}"));
+}
+
+TEST(JsonTextTest, QuotedTextIsJsonWhateverItsBytes) {
+  EXPECT_EQ(quoted("a\"b\x01\xFF"), "\"a\\\"b\\u0001\xEF\xBF\xBD\"");
+}
+
+TEST(JsonTextTest, FieldsStandWithoutQuotesWhereThatLeavesNoDoubt) {
+  EXPECT_EQ(fieldsOfJson(R"({"a":1,"b":"x","c":"two words","d":{"e":[1,2]},"f":"","g h":true})"),
+            R"(a=1 b=x c="two words" d={"e":[1,2]} f="" "g h"=true)");
+}
+
+TEST(JsonTextTest, FieldsCannotDriveATerminal) {
+  EXPECT_EQ(fieldsOfJson("{\"a\\u001b\":\"\\u001b]0;x\\u0007\",\"b\":\"\xC2\x9B\"}"),
+            R"(a\u001b="\u001B]0;x\u0007" b=\u009b)");
+}
+
+TEST(JsonTextTest, WhatIsNoObjectIsShownAsItIs) {
+  EXPECT_EQ(fieldsOfJson("not \x1B json"), "not \\u001b json");
+}
+
+}  // namespace
+}  // namespace halvox::tools

@@ -1,0 +1,69 @@
+#include "tools/Tool.h"
+
+#include <cerrno>
+#include <cstring>
+#include <fstream>
+#include <utility>
+
+#include "tools/CommandLine.h"
+#include "tools/Events.h"
+#include "tools/JsonText.h"
+#include "tools/RequestRunner.h"
+#include "tools/Script.h"
+
+namespace halvox::tools {
+namespace {
+
+ExitStatus runFile(const RunScript& script, const CommonOptions& options,
+                   const ToolStreams& streams) {
+  if (script.file == "-") {
+    return runScript({streams.input, "standard input", false, script.keepGoing}, options,
+                     streams.output, streams.errors);
+  }
+  std::ifstream file(script.file);
+  if (!file) {
+    streams.errors << "halvoxctl run: FILE: cannot read " << harmlessText(script.file) << ": "
+                   << std::strerror(errno) << '\n';
+    return ExitStatus::kBadArguments;
+  }
+  return runScript({file, harmlessText(script.file), false, script.keepGoing}, options,
+                   streams.output, streams.errors);
+}
+
+ExitStatus runCommand(const Command& command, const ToolStreams& streams) {
+  const CommonOptions& options = command.options;
+  if (const auto* request = std::get_if<Request>(&command.what)) {
+    RequestRunner runner(options, streams.output, streams.errors);
+    return runner.run(*request, options.json, "halvoxctl: ");
+  }
+  if (const auto* script = std::get_if<RunScript>(&command.what)) {
+    return runFile(*script, options, streams);
+  }
+  if (std::holds_alternative<RunShell>(command.what)) {
+    return runScript({streams.input, "line", streams.isInputTerminal, true}, options,
+                     streams.output, streams.errors);
+  }
+  return showEvents(std::get<ShowEvents>(command.what),
+                    options.json ? EventForm::kJson : EventForm::kText, streams.output,
+                    streams.outputDescriptor, streams.errors);
+}
+
+}  // namespace
+
+ExitStatus runTool(std::vector<std::string> arguments, const ToolStreams& streams) {
+  auto parsed = parseCommandLine(std::move(arguments), CommandSource::kArguments, streams.input);
+  ExitStatus status = ExitStatus::kDone;
+  if (const auto* text = std::get_if<CommandLineText>(&parsed)) {
+    (text->status == ExitStatus::kDone ? streams.output : streams.errors) << text->text;
+    status = text->status;
+  } else {
+    status = runCommand(std::get<Command>(parsed), streams);
+  }
+  if (!streams.output.flush()) {
+    streams.errors << "halvoxctl: the output cannot be written\n";
+    return status == ExitStatus::kDone ? ExitStatus::kCannotWrite : status;
+  }
+  return status;
+}
+
+}  // namespace halvox::tools

@@ -1,0 +1,17 @@
+#include <csignal>
+#include <iostream>
+#include <string>
+#include <vector>
+
+#include <unistd.h>
+
+#include "tools/Tool.h"
+
+int main(int argc, char** argv) {
+  // Whoever started us may have chosen to ignore it; a reader that has gone ends us quietly.
+  std::signal(SIGPIPE, SIG_DFL);
+  std::ios::sync_with_stdio(false);
+  return static_cast<int>(halvox::tools::runTool(
+      std::vector<std::string>(argv + 1, argv + argc),
+      {std::cin, std::cout, std::cerr, STDOUT_FILENO, isatty(STDIN_FILENO) != 0}));
+}
