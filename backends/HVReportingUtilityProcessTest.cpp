@@ -70,6 +70,7 @@ TEST_F(HVReportingInternalBuildAnswerTest, ConcurrentFirstCallsAskTheDeviceOnce)
 
   {
     std::vector<std::jthread> threads;
+    threads.reserve(kThreads);
     for (int& given : answers) {
       threads.emplace_back([&answer, &given] { given = answer.isInternalBuild() ? 1 : 0; });
     }

@@ -16,6 +16,7 @@ constexpr int kRounds = 5'000;
 template <typename Work>
 void onSeveralThreads(const Work& work) {
   std::vector<std::jthread> threads;
+  threads.reserve(kThreads);
   for (int number = 0; number < kThreads; ++number)
     threads.emplace_back([&work, number] { work(number); });
 }

@@ -190,6 +190,7 @@ TEST_F(FakeDispatchServiceTest, AnyThreadMayAddJobs) {
   int ran = 0;
   {
     std::vector<std::jthread> threads;
+    threads.reserve(4);
     for (int thread = 0; thread < 4; ++thread) {
       threads.emplace_back([&] {
         for (int job = 0; job < 100; ++job) queue->async(JobWeight::kBrief, [&ran] { ++ran; });

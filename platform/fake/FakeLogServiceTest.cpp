@@ -116,6 +116,7 @@ TEST_F(FakeLogServiceTest, ClearForgetsTheLines) {
 TEST_F(FakeLogServiceTest, AnyThreadMayLog) {
   {
     std::vector<std::jthread> threads;
+    threads.reserve(4);
     for (int thread = 0; thread < 4; ++thread) {
       threads.emplace_back([] {
         for (int line = 0; line < 100; ++line) kLog.info("line ", line);
