@@ -37,7 +37,7 @@ std::optional<std::vector<float>> readFloats(const spa_pod& value) {
   }
   std::uint32_t count = 0;
   const void* elements = spa_pod_get_array(&value, &count);
-  if (elements == nullptr || SPA_POD_ARRAY_VALUE_TYPE(&value) != SPA_TYPE_Float ||
+  if (elements == nullptr || count == 0 || SPA_POD_ARRAY_VALUE_TYPE(&value) != SPA_TYPE_Float ||
       SPA_POD_ARRAY_VALUE_SIZE(&value) != sizeof(float)) {
     return std::nullopt;
   }

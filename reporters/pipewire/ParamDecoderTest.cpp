@@ -114,6 +114,11 @@ TEST_F(ParamDecoderTest, RefusesAnArrayWhoseElementsClaimAnotherSize) {
   EXPECT_FALSE(decodeVolume(makeChannelVolumes(32, SPA_TYPE_Float, elements.data(), 64)).channels);
 }
 
+TEST_F(ParamDecoderTest, TakesAnEmptyArrayForNoVolumes) {
+  EXPECT_FALSE(
+      decodeVolume(makeChannelVolumes(sizeof(float), SPA_TYPE_Float, nullptr, 0)).channels);
+}
+
 TEST_F(ParamDecoderTest, ReadsAsManyChannelsAsPipeWireHas) {
   const std::vector<float> elements(1000, 0.5F);
 

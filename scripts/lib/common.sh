@@ -26,13 +26,20 @@ fail() {
 }
 
 # Waits until a command succeeds: halvox_wait_for WHAT SECONDS COMMAND...
-# Returns 1, and says what was awaited, when the time is up. Other processes ending early is the
-# command's to notice.
-halvox_wait_for() {
-  local what=$1 seconds=$2 end
-  shift 2
+# Returns 1, and says what was awaited, when the time is up.
+halvox_wait_for() { halvox_wait_for_start "" "$@"; }
+
+# The same for what a process of ours does when it has started: halvox_wait_for_start PID WHAT ...
+# Gives up at once when that process has ended.
+halvox_wait_for_start() {
+  local pid=$1 what=$2 seconds=$3 end
+  shift 3
   end=$((SECONDS + seconds))
   until "$@" >/dev/null 2>&1; do
+    if [ -n "$pid" ] && ! halvox_is_running "$pid"; then
+      printf '%s\n' "$HALVOX_SCRIPT: waiting for $what: the process has ended" >&2
+      return 1
+    fi
     if ((SECONDS > end)); then
       printf '%s\n' "$HALVOX_SCRIPT: waited $seconds s in vain for $what" >&2
       return 1

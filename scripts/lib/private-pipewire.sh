@@ -103,10 +103,12 @@ halvox_audio_start_servers() {
   local directory=$1
   halvox_start pipewire "$directory/pipewire.log" pipewire -c "$directory/pipewire.conf"
   HALVOX_PIPEWIRE_PID=$HALVOX_PID
-  halvox_wait_for "PipeWire's socket" 10 halvox_audio_socket_exists "$XDG_RUNTIME_DIR/pipewire-0"
+  halvox_wait_for_start "$HALVOX_PID" "PipeWire's socket" 10 \
+    halvox_audio_socket_exists "$XDG_RUNTIME_DIR/pipewire-0"
   halvox_start wireplumber "$directory/wireplumber.log" wireplumber
   HALVOX_WIREPLUMBER_PID=$HALVOX_PID
-  halvox_wait_for "WirePlumber to find the sink" 20 halvox_audio_has_default_sink
+  halvox_wait_for_start "$HALVOX_PID" "WirePlumber to find the sink" 20 \
+    halvox_audio_has_default_sink
 }
 
 halvox_audio_stop_servers() {
@@ -123,7 +125,8 @@ halvox_audio_start() {
   halvox_start dbus-daemon "$directory/dbus.log" dbus-daemon --session --nofork --nopidfile \
     "--address=$DBUS_SESSION_BUS_ADDRESS"
   HALVOX_BUS_PID=$HALVOX_PID
-  halvox_wait_for "the private bus" 10 halvox_audio_socket_exists "$XDG_RUNTIME_DIR/bus"
+  halvox_wait_for_start "$HALVOX_PID" "the private bus" 10 \
+    halvox_audio_socket_exists "$XDG_RUNTIME_DIR/bus"
   halvox_audio_start_servers "$directory"
 }
 
