@@ -118,6 +118,7 @@ class NullLogCategory final : public platform::LogCategory {
   void write(platform::LogLevel /*level*/, std::string_view line) override {
     bytes_ += line.size();
   }
+  void setLevel(platform::LogLevel level) { threshold_.store(level, std::memory_order_relaxed); }
   [[nodiscard]] std::size_t bytes() const { return bytes_; }
 
  private:
@@ -131,6 +132,8 @@ class NullLog final : public platform::LogService {
                                         std::string_view /*category*/) override {
     return category_;
   }
+  void setLevel(platform::LogLevel level) { category_.setLevel(level); }
+  // Length of all lines so far.
   [[nodiscard]] std::size_t bytes() const { return category_.bytes(); }
 
  private:

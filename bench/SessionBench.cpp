@@ -164,6 +164,19 @@ void BM_SessionSendMessage(benchmark::State& state, bool redundant) {
   state.SetItemsProcessed(state.iterations());
 }
 
+// Starting and stopping one session among others that are started: both log all of them, at the
+// level that is on unless somebody turned it off.
+void BM_RestartAmong(benchmark::State& state) {
+  Scene scene(1, state.range(0));
+  nullPlatform().log.setLevel(platform::LogLevel::kDefault);
+  const std::size_t before = nullPlatform().log.bytes();
+  for (auto _ : state) scene.restart();
+  state.counters["log_bytes"] = benchmark::Counter(
+      static_cast<double>(nullPlatform().log.bytes() - before), benchmark::Counter::kAvgIterations);
+  nullPlatform().log.setLevel(platform::LogLevel::kError);
+}
+
+BENCHMARK(BM_RestartAmong)->Arg(1)->Arg(100)->Arg(10'000);
 BENCHMARK_CAPTURE(BM_SendMessage, one_session, 1, 1, 0);
 BENCHMARK_CAPTURE(BM_SendMessage, of_10000_sessions, 1, 10'000, 0);
 BENCHMARK_CAPTURE(BM_SendMessage, of_1000_clients, 1'000, 1, 0);

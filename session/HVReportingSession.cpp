@@ -105,6 +105,11 @@ void HVReportingSession::updateConfigurationWithContentsOfConfiguration(
   charge(before, current->memorySize());
 }
 
+platform::ProcessID HVReportingSession::ownerPid() const {
+  const auto owners = processIdentifiers_.lock();
+  return owners->empty() ? 0 : owners->front();
+}
+
 std::string HVReportingSession::description() const {
   std::string text;
   appendDescription(text);
@@ -112,13 +117,12 @@ std::string HVReportingSession::description() const {
 }
 
 void HVReportingSession::appendDescription(std::string& text) const {
-  const ProcessIdentifiers owners = processIdentifiers();
   text += "reporterID=";
   text += std::to_string(number(reporterID_));
   text += ",serviceName=";
   text += serviceName();
   text += ",ownerPid=";
-  text += std::to_string(owners.empty() ? 0 : owners.front());
+  text += std::to_string(ownerPid());
   text += ",HostApplicationDisplayID=";
   text += platform::describe(HVReportingUtilityRetrieveAppName(configuration()));
   text += started() ? ",started=1" : ",started=0";

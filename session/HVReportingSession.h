@@ -113,6 +113,7 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
                                            const platform::Dictionary& message);
 
  private:
+  [[nodiscard]] platform::ProcessID ownerPid() const;  // 0 when there is none
   void charge(std::size_t before, std::size_t after);
   void record(AudioEventCategory category, AudioEventType type,
               const platform::Dictionary& message);
