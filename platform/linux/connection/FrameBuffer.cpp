@@ -24,10 +24,10 @@ std::size_t headerBytes(std::span<const std::byte> frame) {
 }  // namespace
 
 std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
-  if (const std::size_t missing = missingBytesOfLargeFrame(); missing > 0) {
+  if (const std::size_t wanted = bytesThatDoNotFitScratch(); wanted > 0) {
     // A header may promise a lot: room is made for as much again as has come, not for all of it.
     const std::size_t offset = own_.size() - view_.size();
-    const std::size_t grow = std::min(missing, std::max(view_.size(), kReadBytes));
+    const std::size_t grow = std::min(wanted, std::max(view_.size(), kReadBytes));
     own_.erase(own_.begin(), own_.begin() + static_cast<std::ptrdiff_t>(offset));
     const std::size_t used = own_.size();
     own_.resize(used + grow);
@@ -117,13 +117,16 @@ std::vector<std::byte> FrameBuffer::withoutBody(const Next& oversized) {
   return frame;
 }
 
-// More than 0 when the frame that has begun does not fit the scratch and is to be had in full.
-std::size_t FrameBuffer::missingBytesOfLargeFrame() const {
-  if (view_.size() < dbus::kFrameStartBytes) return 0;
-  const dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);
-  if (measure.state != dbus::FrameMeasure::State::kKnown) return 0;
-  if (measure.totalBytes <= kReadBytes || measure.totalBytes > maxFrameBytes_) return 0;
-  return measure.totalBytes > view_.size() ? measure.totalBytes - view_.size() : 0;
+// More than 0 when the next read must go to storage of our own: what is missing of a large frame,
+// or one read when more is left over than the scratch has room for.
+std::size_t FrameBuffer::bytesThatDoNotFitScratch() const {
+  if (view_.size() >= dbus::kFrameStartBytes) {
+    const dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);
+    const bool isLarge = measure.state == dbus::FrameMeasure::State::kKnown &&
+                         measure.totalBytes > kReadBytes && measure.totalBytes <= maxFrameBytes_;
+    if (isLarge && measure.totalBytes > view_.size()) return measure.totalBytes - view_.size();
+  }
+  return view_.size() > kReadBytes ? kReadBytes : 0;
 }
 
 }  // namespace halvox::platform::linux_

@@ -68,7 +68,7 @@ class FrameBuffer {
   [[nodiscard]] static std::vector<std::byte> withoutBody(const Next& oversized);
 
  private:
-  [[nodiscard]] std::size_t missingBytesOfLargeFrame() const;
+  [[nodiscard]] std::size_t bytesThatDoNotFitScratch() const;
 
   std::size_t maxFrameBytes_;
   std::vector<std::byte> own_;

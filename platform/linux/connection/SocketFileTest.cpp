@@ -1,0 +1,111 @@
+#include "platform/linux/connection/SocketFile.h"
+
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <string>
+#include <variant>
+
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include "platform/linux/connection/testing/ServiceUnderTest.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using Kind = ConnectionOpenError::Kind;
+using std::filesystem::path;
+
+class SocketFileTest : public testing::Test {
+ protected:
+  [[nodiscard]] path socketPath() const { return directory_.path() / "s"; }
+  ScratchDirectory directory_;
+};
+
+Kind kindOf(const std::variant<BoundSocket, ConnectionOpenError>& result) {
+  const auto* error = std::get_if<ConnectionOpenError>(&result);
+  EXPECT_NE(error, nullptr);
+  return error != nullptr ? error->kind : Kind::kSystem;
+}
+
+TEST_F(SocketFileTest, AnybodyMayConnect) {
+  const auto bound = listenOn(socketPath());
+
+  ASSERT_TRUE(std::holds_alternative<BoundSocket>(bound));
+  const auto permissions = std::filesystem::status(socketPath()).permissions();
+  EXPECT_EQ(static_cast<unsigned>(permissions) & 0777U, 0666U);
+}
+
+TEST_F(SocketFileTest, FileIsRemovedAtTheEnd) {
+  { const auto bound = listenOn(socketPath()); }
+
+  EXPECT_FALSE(std::filesystem::exists(socketPath()));
+}
+
+TEST_F(SocketFileTest, FileOfSomebodyElseIsLeftAtTheEnd) {
+  {
+    const auto bound = listenOn(socketPath());
+    std::filesystem::rename(socketPath(), directory_.path() / "moved");
+    std::ofstream(socketPath()) << "somebody else's";
+  }
+
+  EXPECT_TRUE(std::filesystem::exists(socketPath()));
+}
+
+TEST_F(SocketFileTest, SocketOfALiveServiceIsLeftAlone) {
+  const auto live = listenOn(socketPath());
+
+  EXPECT_EQ(kindOf(listenOn(socketPath())), Kind::kAlreadyServed);
+  EXPECT_TRUE(std::filesystem::is_socket(socketPath()));
+}
+
+TEST_F(SocketFileTest, SocketThatNobodyServesIsReplaced) {
+  auto dead = listenOn(socketPath());
+  std::get<BoundSocket>(dead).fd.reset();
+  ASSERT_TRUE(std::filesystem::is_socket(socketPath()));
+
+  EXPECT_TRUE(std::holds_alternative<BoundSocket>(listenOn(socketPath())));
+}
+
+TEST_F(SocketFileTest, OtherFileIsLeftAlone) {
+  std::ofstream(socketPath()) << "precious";
+
+  EXPECT_EQ(kindOf(listenOn(socketPath())), Kind::kNotASocket);
+  EXPECT_TRUE(std::filesystem::is_regular_file(socketPath()));
+}
+
+TEST_F(SocketFileTest, MissingDirectoryIsTold) {
+  EXPECT_EQ(kindOf(listenOn(directory_.path() / "missing" / "s")), Kind::kDirectoryMissing);
+}
+
+TEST_F(SocketFileTest, DirectoryThatCannotBeWrittenIsTold) {
+  std::filesystem::permissions(directory_.path(), std::filesystem::perms(0555));
+
+  // In a process of its own, which gives up the rights of the administrator first.
+  const pid_t child = fork();
+  if (child == 0) {
+    constexpr uid_t kNobody = 65534;
+    if (geteuid() == 0 && setresuid(kNobody, kNobody, kNobody) != 0) _exit(2);
+    const auto result = listenOn(socketPath());
+    const auto* error = std::get_if<ConnectionOpenError>(&result);
+    _exit(error != nullptr && error->kind == Kind::kDirectoryNotWritable ? 0 : 1);
+  }
+  int status = 0;
+  ASSERT_EQ(waitpid(child, &status, 0), child);
+  std::filesystem::permissions(directory_.path(), std::filesystem::perms(0755));
+
+  EXPECT_EQ(status, 0);
+}
+
+TEST_F(SocketFileTest, PathThatNoAddressHoldsIsTold) {
+  EXPECT_EQ(kindOf(listenOn(directory_.path() / std::string(200, 'a'))), Kind::kPathTooLong);
+  EXPECT_EQ(kindOf(listenOn("")), Kind::kPathTooLong);
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_
