@@ -26,7 +26,8 @@ class OwnThreadQueue;
 // and never two of a queue run at once, whoever runs them.
 class AsioDispatchService final : public DispatchService {
  public:
-  // Both services must outlive this one and its queues.
+  // Both services must outlive this one and its queues. Throws std::system_error when the system
+  // has no threads to give.
   AsioDispatchService(LogService& log, StatisticsService& statistics);
   // Stops, and waits for the jobs that run without a limit.
   ~AsioDispatchService() override;

@@ -1,5 +1,6 @@
 #include "platform/linux/runtime/DispatchPool.h"
 
+#include <system_error>
 #include <utility>
 
 #include <asio/post.hpp>
@@ -9,15 +10,15 @@
 namespace halvox::platform::linux_ {
 
 DispatchPool::DispatchPool(std::shared_ptr<JobRunner> runner) : runner_(std::move(runner)) {
-  for (std::thread& thread : threads_) thread = std::thread(&DispatchPool::run, this);
-}
-
-DispatchPool::~DispatchPool() {
-  stop();
-  for (std::thread& thread : threads_) {
-    if (thread.joinable()) thread.join();
+  try {
+    for (std::thread& thread : threads_) thread = std::thread(&DispatchPool::run, this);
+  } catch (const std::system_error&) {
+    end();
+    throw;
   }
 }
+
+DispatchPool::~DispatchPool() { end(); }
 
 void DispatchPool::stop() {
   isStopped_.store(true, std::memory_order_relaxed);
@@ -32,10 +33,15 @@ bool DispatchPool::waitForEnd(std::chrono::steady_clock::time_point deadline) {
       if (!ended_.waitUntil(mutex_, deadline) && running_ > 0) return false;
     }
   }
+  end();
+  return true;
+}
+
+void DispatchPool::end() {
+  stop();
   for (std::thread& thread : threads_) {
     if (thread.joinable()) thread.join();
   }
-  return true;
 }
 
 void DispatchPool::discardJobs() {

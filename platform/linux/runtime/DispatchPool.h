@@ -24,6 +24,7 @@ namespace halvox::platform::linux_ {
 // it.
 class DispatchPool {
  public:
+  // Throws std::system_error when the system has no threads to give.
   explicit DispatchPool(std::shared_ptr<JobRunner> runner);
   // Waits for the jobs that run.
   ~DispatchPool();
@@ -46,6 +47,7 @@ class DispatchPool {
   static constexpr std::size_t kThreads = 2;
 
   void run();
+  void end();
 
   const std::shared_ptr<JobRunner> runner_;
   std::atomic<bool> isStopped_{false};

@@ -3,13 +3,16 @@
 #include <algorithm>
 #include <array>
 #include <atomic>
+#include <fstream>
 #include <future>
 #include <memory>
 #include <optional>
+#include <string>
 #include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include "platform/linux/runtime/AsioDispatchService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
@@ -31,6 +34,20 @@ class HelpingTest : public ::testing::Test {
     auto ran = done.get_future();
     queue.async(JobWeight::kMayBlock, [&done] { done.set_value(); });
     return ran.wait_for(kTestDeadline) == std::future_status::ready;
+  }
+  // Waits until the queue's own thread has nothing to do and must be woken for its next job.
+  static bool letOwnThreadSleep(DispatchQueue& queue) {
+    pid_t thread = 0;
+    queue.async(JobWeight::kMayBlock, [&thread] { thread = ::gettid(); });
+    if (!drain(queue)) return false;
+    const std::string status = "/proc/self/task/" + std::to_string(thread) + "/stat";
+    return waitFor([&status] {
+      std::string number;
+      std::string name;
+      char state = 0;
+      std::ifstream(status) >> number >> name >> state;
+      return state == 'S';
+    });
   }
   // A job that notes the thread that runs it.
   static Job noteThread(ThreadIDs& threads) {
@@ -140,6 +157,31 @@ TEST_F(HelpingTest, HelperDoesNotWaitForTheOwnThreadAtWork) {
   EXPECT_NE(threads[0], self_);
 }
 
+TEST_F(HelpingTest, HelperLeavesItsJobsToTheOwnThreadThatAnotherThreadWoke) {
+  const auto queue = createQueue();
+  std::promise<void> started;
+  std::promise<void> release;
+  ThreadIDs threads;
+
+  service_.beginHelping();
+  queue->async(JobWeight::kBrief, noteThread(threads));
+  std::thread([&] {
+    queue->async(JobWeight::kMayBlock, [&] {
+      started.set_value();
+      release.get_future().wait();
+    });
+    started.get_future().wait();
+  }).join();
+  queue->async(JobWeight::kBrief, noteThread(threads));
+  service_.endHelping();
+  EXPECT_EQ(threads.size(), 1U);
+  release.set_value();
+  ASSERT_TRUE(drain(*queue));
+
+  EXPECT_EQ(threads.size(), 2U);
+  EXPECT_EQ(std::ranges::count(threads, self_), 0);
+}
+
 TEST_F(HelpingTest, HelperRunsWhatItsJobsAddToThisAndOtherQueues) {
   const auto queue = createQueue();
   const auto other = createQueue();
@@ -171,6 +213,7 @@ TEST_F(HelpingTest, EndlessWorkIsLeftToTheOwnThread) {
     queue->async(JobWeight::kBrief, again);
   };
 
+  ASSERT_TRUE(letOwnThreadSleep(*queue));
   service_.beginHelping();
   queue->async(JobWeight::kBrief, again);
   service_.endHelping();

@@ -1,6 +1,9 @@
 #include "platform/linux/runtime/Utf8.h"
 
+#include <algorithm>
+#include <random>
 #include <string>
+#include <string_view>
 
 #include <gtest/gtest.h>
 
@@ -40,6 +43,20 @@ TEST(Utf8Test, EscapesBytesThatAreNoCharacters) { EXPECT_EQ(escaped("\xC3("), "\
 
 TEST(Utf8Test, LeavesOtherTextAsItStands) {
   EXPECT_EQ(escaped("naïve \"quoted\" \\n 😀"), "naïve \"quoted\" \\n 😀");
+}
+
+TEST(Utf8Test, EscapedBytesOfAnyKindAreOneLineOfUtf8) {
+  std::mt19937 random(1);  // always the same
+  for (int round = 0; round < 2000; ++round) {
+    std::string bytes(random() % 40, '\0');
+    for (char& byte : bytes) byte = static_cast<char>(random());
+
+    const std::string line = escaped(bytes, 60);
+
+    ASSERT_LE(line.size(), 60U);
+    ASSERT_EQ(replaceInvalidUtf8(line), line);
+    ASSERT_TRUE(std::ranges::none_of(line, [](char byte) { return byte >= 0 && byte < 0x20; }));
+  }
 }
 
 TEST(Utf8Test, StopsBeforeThePartThatFindsNoRoom) {
