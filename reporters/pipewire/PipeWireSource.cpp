@@ -42,17 +42,24 @@ GlobalID idProperty(const Properties& properties, std::string_view key) {
   return number <= UINT32_MAX ? static_cast<GlobalID>(number) : 0;
 }
 
+void fillIn(Properties& properties, std::string_view key, std::string_view value) {
+  std::string& text = properties[std::string(key)];
+  if (text.empty()) {
+    text = value;
+  }
+}
+
 // A stream's own properties, and behind them what its client says about the application.
 Properties withClient(const Properties& stream, const Properties& client) {
   Properties all = stream;
   for (const auto& [key, value] : client) {
     if (key.starts_with("application.") || key == "client.api") {
-      all.emplace(key, value);
+      fillIn(all, key, value);
     }
   }
   // What the server knows of the process at the other end of the socket.
   if (const auto pid = property(client, "pipewire.sec.pid"); !pid.empty()) {
-    all.emplace("application.process.id", pid);
+    fillIn(all, "application.process.id", pid);
   }
   return all;
 }
