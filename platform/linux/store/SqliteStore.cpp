@@ -16,7 +16,7 @@ namespace {
 constexpr UnitLog kLog{storeCategory, "SqliteStore"};
 
 // Bounds how long one transaction, and with it the visibility of a record, can take.
-constexpr std::int64_t kRecordsPerTransaction = 8192;
+constexpr std::int64_t kRecordsPerTransaction = 4096;
 // After a failure records gather for so long before the next attempt.
 constexpr std::chrono::milliseconds kRetryTime{250};
 

@@ -1,8 +1,14 @@
 #include "platform/linux/store/WriterQueue.h"
 
 #include <algorithm>
+#include <utility>
 
 namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::uint64_t kTellingRecords = 256;
+
+}  // namespace
 
 WriterQueue::WriterQueue(const QueueLimits& limits, Backpressure& backpressure)
     : limits_(limits),
@@ -30,6 +36,7 @@ bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
     work_.waitUntil(mutex_, notBefore);
   }
   writer_ = Writer::kWorking;
+  workingSince_ = std::chrono::steady_clock::now();
   if (queued_ == 0) return false;
   take();
   queued_ = 0;
@@ -79,10 +86,19 @@ bool WriterQueue::noteAdded() {
 
 void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {
   if (records == 0) return;
-  // Rises at once and falls slowly: what waits is more likely like the largest seen lately.
+  const Time now = std::chrono::steady_clock::now();
+  const std::chrono::nanoseconds elapsed = now - std::exchange(workingSince_, now);
+  // Estimates rise at once and fall slowly: what waits is more likely like the worst seen lately.
   bytesPerRecord_ = std::max(bytes / records, bytesPerRecord_ - bytesPerRecord_ / 4);
+  // A commit costs the same however little is in it, so small ones tell nothing about a flood.
+  if (records >= kTellingRecords || elapsed >= limits_.softTime) {
+    timePerRecord_ =
+        std::max(elapsed / static_cast<std::int64_t>(records), timePerRecord_ - timePerRecord_ / 4);
+  }
   const std::uint64_t bySize = limits_.softBytes / std::max<std::uint64_t>(bytesPerRecord_, 1);
-  softRecords_ = std::clamp<std::uint64_t>(bySize, 1, limits_.softRecords);
+  const auto byTime = static_cast<std::uint64_t>(
+      limits_.softTime / std::max(timePerRecord_, std::chrono::nanoseconds(1)));
+  softRecords_ = std::clamp<std::uint64_t>(std::min(bySize, byTime), 1, limits_.softRecords);
   // Gathering must end before callers have to wait.
   gatherRecords_ = std::clamp<std::uint64_t>(softRecords_ / 2, 1, limits_.gatherRecords);
 }

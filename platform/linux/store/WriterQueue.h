@@ -9,11 +9,12 @@
 
 namespace halvox::platform::linux_ {
 
-// How many records may wait. Payloads are built when they are written, so bytes are known only
-// then: the sizes of the last payloads stand for those that wait.
+// How many records may wait. Payloads are built when they are written, so bytes and time are known
+// only then: the sizes of the last payloads, and how long writing took, stand for those that wait.
 struct QueueLimits {
   std::uint64_t softRecords = 8192;
   std::uint64_t softBytes = 16U << 20U;
+  std::chrono::milliseconds softTime{75};
   std::uint64_t hardFactor = 4;  // at so many times the soft limit callers wait
 
   std::chrono::milliseconds gatherTime{20};
@@ -56,7 +57,8 @@ class WriterQueue {
   // The writer: waits for records, at least until `notBefore` unless many wait, then runs `take`
   // under the lock, which must take all that is queued. False when the queue is closed and empty.
   bool take(Time notBefore, const std::function<void()>& take) HALVOX_EXCLUDES(mutex_);
-  // The writer: so many of the taken records are done with; `bytes` were in their payloads.
+  // The writer: so many of the taken records are done with; `bytes` were in their payloads. It was
+  // at work on them since the last call of this or of take().
   void finish(std::uint64_t records, std::uint64_t bytes) HALVOX_EXCLUDES(mutex_);
   // The writer: whether records came since the last take().
   [[nodiscard]] bool hasQueued() HALVOX_EXCLUDES(mutex_);
@@ -82,7 +84,9 @@ class WriterQueue {
   std::uint64_t waiting_ HALVOX_GUARDED_BY(mutex_) = 0;  // queued or taken
   std::uint64_t callersWaiting_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t bytesPerRecord_ HALVOX_GUARDED_BY(mutex_) = 0;
-  // The limits as the sizes of the last payloads make them.
+  std::chrono::nanoseconds timePerRecord_ HALVOX_GUARDED_BY(mutex_){};
+  Time workingSince_ HALVOX_GUARDED_BY(mutex_);
+  // The limits as the last payloads make them.
   std::uint64_t softRecords_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t gatherRecords_ HALVOX_GUARDED_BY(mutex_);
   bool closed_ HALVOX_GUARDED_BY(mutex_) = false;

@@ -10,6 +10,7 @@ namespace {
 
 constexpr QueueLimits kSmall{.softRecords = 8,
                              .softBytes = 1000,
+                             .softTime = std::chrono::milliseconds(75),
                              .hardFactor = 2,
                              .gatherTime = std::chrono::milliseconds(0),
                              .gatherRecords = 4};
@@ -74,6 +75,19 @@ TEST(WriterQueueTest, HoldsFewerRecordsWhenTheirPayloadsAreLarge) {
   addMany(queue, 1);
   EXPECT_FALSE(backpressure.isHigh());
   addMany(queue, 1);
+  EXPECT_TRUE(backpressure.isHigh());
+}
+
+TEST(WriterQueueTest, HoldsFewerRecordsWhenWritingIsSlow) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  addMany(queue, 4);
+  ASSERT_TRUE(queue.take(soon(), [] {}));
+  std::this_thread::sleep_for(kSmall.softTime);  // the slow writing
+  queue.finish(4, 0);
+
+  // Four take more than the soft time, so four are too many.
+  addMany(queue, 4);
   EXPECT_TRUE(backpressure.isHigh());
 }
 
