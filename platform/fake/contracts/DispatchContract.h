@@ -73,6 +73,7 @@ TYPED_TEST_P(DispatchContract, RunsNoTwoJobsOfOneQueueAtOnce) {
     };
 
     std::vector<std::thread> adders;
+    adders.reserve(4);
     for (int thread = 0; thread < 4; ++thread) {
       adders.emplace_back([&] {
         for (int count = 0; count < 500; ++count) queue->async(JobWeight::kBrief, job);

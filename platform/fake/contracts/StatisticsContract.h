@@ -35,6 +35,7 @@ TYPED_TEST_P(StatisticsContract, CountsOfAllThreadsAddUp) {
   const std::uint64_t before = this->service_.counter("contract", "received").value();
 
   std::vector<std::thread> threads;
+  threads.reserve(4);
   for (int thread = 0; thread < 4; ++thread) {
     threads.emplace_back([this] {
       for (int count = 0; count < 1000; ++count) {

@@ -191,7 +191,7 @@ Configuration defaultConfiguration() {
 std::variant<Configuration, ConfigurationError> loadConfiguration() {
   const std::filesystem::path file = configurationPath();
   auto content = readText(file);
-  if (auto* error = std::get_if<ConfigurationError>(&content)) return *std::move(error);
+  if (auto* error = std::get_if<ConfigurationError>(&content)) return std::move(*error);
   const auto& text = std::get<std::optional<std::string>>(content);
   if (text.has_value()) return parse(file.native(), *text);
   if (configurationVariable() != nullptr) return unreadable(file, ENOENT);

@@ -47,7 +47,7 @@ class ConfigurationTest : public ::testing::Test {
   }
 
   std::filesystem::path write(std::string_view text, const std::string& name = "halvox.toml") {
-    const std::filesystem::path file = directory_ / name;
+    std::filesystem::path file = directory_ / name;
     std::filesystem::create_directories(file.parent_path());
     std::ofstream(file, std::ios::binary) << text;
     return file;

@@ -303,6 +303,7 @@ class HelpingTrial : public HelpingTest {
 
 TEST_F(HelpingTrial, OrderAndExclusionHoldWhoeverRunsTheJobs) {
   std::vector<std::thread> threads;
+  threads.reserve(Record::kAdders);
   for (std::size_t adder = 0; adder < Record::kAdders; ++adder) {
     threads.emplace_back([this, adder] { add(adder); });
   }
@@ -319,6 +320,7 @@ TEST_F(HelpingTrial, OrderAndExclusionHoldWhoeverRunsTheJobs) {
 TEST_F(HelpingTrial, StopAmidHelpingEndsAllThreads) {
   std::atomic<bool> isOver{false};
   std::vector<std::thread> threads;
+  threads.reserve(3);
   for (int helper = 0; helper < 3; ++helper) {
     threads.emplace_back([&] {
       while (!isOver) {

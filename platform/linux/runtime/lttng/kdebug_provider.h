@@ -11,7 +11,8 @@
 #include <lttng/tracepoint.h>
 #include <stdint.h>
 
-/* clang-format off: the macros are laid out as a record */
+// The macros are laid out as a record.
+/* clang-format off */
 LTTNG_UST_TRACEPOINT_EVENT(
     halvox, kdebug,
     LTTNG_UST_TP_ARGS(uint32_t, code_value,
