@@ -11,7 +11,7 @@ namespace halvox::client {
 SocketWatch::SocketWatch(const std::string& socketPath)
     : directory_(std::filesystem::path(socketPath).parent_path()),
       name_(std::filesystem::path(socketPath).filename()) {
-  if (directory_.empty()) directory_ = ".";
+  if (directory_.empty()) directory_.push_back('.');  // GCC 12 warns about assigning "." here
 }
 
 void SocketWatch::begin() {
