@@ -17,6 +17,8 @@ constexpr std::size_t kMaxWaitingOperations = 8192;
 constexpr std::chrono::seconds kFarewell{1};
 // How often to look for work where the system gave no descriptor to be woken through.
 constexpr std::chrono::milliseconds kPauseWithoutWakeUp{50};
+// What "wait for ever" comes to, so that no point in time lies beyond what the clock can tell.
+constexpr std::chrono::hours kLongestWait{24 * 365};
 
 // Threads inherit the signal mask. The program's signals are for its own threads.
 class SignalsBlocked {
@@ -36,6 +38,10 @@ class SignalsBlocked {
 
 Options withDefaults(Options options) {
   if (options.socketPath.empty()) options.socketPath = defaultSocketPath();
+  options.requestTimeout =
+      std::min<std::chrono::milliseconds>(options.requestTimeout, kLongestWait);
+  options.reconnectMax = std::min<std::chrono::milliseconds>(options.reconnectMax, kLongestWait);
+  options.reconnectMin = std::min(options.reconnectMin, options.reconnectMax);
   options.reconnectMin = std::max(options.reconnectMin, std::chrono::milliseconds(1));
   options.reconnectMax = std::max(options.reconnectMax, options.reconnectMin);
   return options;
@@ -95,7 +101,8 @@ void ClientWorker::post(SessionOperation operation) {
 bool ClientWorker::flush(std::chrono::milliseconds timeout) {
   // The handler runs on the thread that would have to do it.
   if (std::this_thread::get_id() == thread_.get_id()) return false;
-  const TimePoint deadline = std::chrono::steady_clock::now() + timeout;
+  const TimePoint deadline =
+      std::chrono::steady_clock::now() + std::min<std::chrono::milliseconds>(timeout, kLongestWait);
   const MutexLock lock(mutex_);
   const std::uint64_t position = ring_.tail();
   // Flushes with nothing between them share a ticket, so that they cannot fill the lane.

@@ -61,8 +61,10 @@ struct Counters {
   std::uint64_t accepted = 0;      // taken by send()
   std::uint64_t dropped = 0;       // not taken: the hand-off was full or the client was closing
   std::uint64_t acknowledged = 0;  // answered by the service
-  std::uint64_t refused = 0;       // answered with an error
-  std::uint64_t lost = 0;     // in flight when a connection ended: the service may have had them
+  std::uint64_t refused = 0;       // answered with an error, or without a form on the wire
+  // In flight when a connection ended: the service may have had them, so they are not sent again.
+  // Also what waited when more than 8,192 session operations had piled up without a service.
+  std::uint64_t lost = 0;
   std::uint64_t pending = 0;  // waiting or in flight
   std::uint64_t reconnects = 0;
 };
@@ -77,6 +79,10 @@ struct Counters {
 // Any thread may call. send() never blocks, locks for long or waits for the service, so an audio
 // thread may call it; it does allocate when the message does. The other operations may wait for a
 // lock for a moment. Destruction delivers what is pending for at most a second and ends the thread.
+//
+// The numbers that categories, types and services stand for are in client/Vocabulary.h. A client
+// does not work in a process that was forked off its own. Making one throws std::system_error or
+// std::bad_alloc when there is no thread or no memory to be had.
 class HalvoxClient {
  public:
   explicit HalvoxClient(Options options = {});
@@ -99,11 +105,14 @@ class HalvoxClient {
   bool send(std::optional<std::vector<ReporterID>> ids, Dictionary message, Category category,
             EventType type);
 
-  // Waits until everything handed over before has been answered, or until the time is up (false).
+  // Waits until everything handed over before has been answered or lost, or until the time is up
+  // (false). False at once on the client's own thread, and when the client is being destroyed.
   bool flush(std::chrono::milliseconds timeout);
   [[nodiscard]] bool isConnected() const;
   [[nodiscard]] Counters counters() const;
-  // Called on the client's thread whenever the connection is made (true) or lost (false).
+  // Called on the client's thread whenever the connection is made (true) or lost (false), and soon
+  // with true when it is made already. An empty one ends that, except for a call that is under way;
+  // none comes after the client's destruction.
   void setConnectionHandler(std::function<void(bool connected)> handler);
 
  private:

@@ -14,10 +14,15 @@ using BusSlot = platform::linux_::UniqueHandle<sd_bus_slot*, sd_bus_slot_unref>;
 
 // sd_bus_call() without a limit would wait for ever for a service that holds an answer back.
 constexpr std::chrono::milliseconds kShortestTimeout{1};
+// Beyond this a point in time may lie beyond what the clock can tell.
+constexpr std::chrono::milliseconds kLongestTimeout = std::chrono::hours(24 * 365);
+
+std::chrono::milliseconds bounded(std::chrono::milliseconds timeout) {
+  return std::clamp(timeout, kShortestTimeout, kLongestTimeout);
+}
 
 std::uint64_t toMicroseconds(std::chrono::milliseconds timeout) {
-  return static_cast<std::uint64_t>(
-      std::chrono::microseconds(std::max(timeout, kShortestTimeout)).count());
+  return static_cast<std::uint64_t>(std::chrono::microseconds(timeout).count());
 }
 
 struct BusError {
@@ -78,7 +83,8 @@ int onHeldReply(sd_bus_message* answer, void* userData, sd_bus_error* /*error*/)
 
 class HalvoxConnection::Impl {
  public:
-  Impl(Bus bus, std::chrono::milliseconds timeout) : bus_(std::move(bus)), timeout_(timeout) {}
+  Impl(Bus bus, std::chrono::milliseconds timeout)
+      : bus_(std::move(bus)), timeout_(bounded(timeout)) {}
 
   [[nodiscard]] sd_bus* bus() const { return bus_.get(); }
   [[nodiscard]] Deadline deadline() const { return std::chrono::steady_clock::now() + timeout_; }
@@ -183,7 +189,7 @@ Result<bool> HalvoxConnection::waitForStartReply(ReporterID id, std::chrono::mil
         {Failure::Kind::kBadRequest, "",
          "session " + std::to_string(id) + " was not started over this connection"});
   }
-  const Deadline deadline = std::chrono::steady_clock::now() + timeout;
+  const Deadline deadline = std::chrono::steady_clock::now() + bounded(timeout);
   while (!found->second->answer) {
     const int result = processUntil(impl_->bus(), deadline);
     if (found->second->answer) break;

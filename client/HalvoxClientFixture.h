@@ -1,0 +1,50 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "client/HalvoxClient.h"
+#include "client/TestService.h"
+
+namespace halvox::client {
+
+// As long as a slow machine may need.
+inline constexpr std::chrono::seconds kPatience{20};
+inline constexpr Category kPlayback = 4;
+inline constexpr EventType kStart = 1;
+
+// A service that plays along, in a directory of the test's own.
+class HalvoxClientTest : public testing::Test {
+ protected:
+  HalvoxClientTest() : socketPath_(scratch_.path("reporting.sock")), service_(socketPath_) {}
+
+  [[nodiscard]] Options options() const {
+    return {.socketPath = socketPath_,
+            .reconnectMin = std::chrono::milliseconds(5),
+            .reconnectMax = std::chrono::milliseconds(100)};
+  }
+  // The numbers "n" of all messages that arrived, in their order.
+  std::vector<std::int64_t> numbersReceived() {
+    std::vector<std::int64_t> numbers;
+    for (const auto& call : service_.calls()) {
+      if (call.member != "sendMessage") continue;
+      numbers.push_back(call.arguments.at(0).dictionary().find("n")->toInt64());
+    }
+    return numbers;
+  }
+
+  ScratchDirectory scratch_;
+  std::string socketPath_;
+  TestService service_;
+};
+
+inline void expectBalance(const Counters& counters) {
+  EXPECT_EQ(counters.accepted,
+            counters.acknowledged + counters.refused + counters.lost + counters.pending);
+}
+
+}  // namespace halvox::client
