@@ -247,7 +247,8 @@ def activated():
         "--setenv=HALVOX_CONFIG", "--setenv=XDG_RUNTIME_DIR", "--setenv=XDG_STATE_HOME",
         str(harness.SERVICE)])
     service.start(wait=False)
-    wait_for("the activation socket", service.socket.exists)
+    # The file is there before anybody listens on it; the tool says when.
+    wait_for("the activation socket", lambda: "Listening on" in service.log())
     return service
 
 
