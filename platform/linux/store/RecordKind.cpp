@@ -8,6 +8,8 @@ std::string_view counterName(DropReason reason) {
       return "dropped: disk full";
     case DropReason::kLocked:
       return "dropped: database locked";
+    case DropReason::kLogHeld:
+      return "dropped: log held by a reader";
     case DropReason::kDamaged:
       return "dropped: database damaged";
     case DropReason::kInputOutput:

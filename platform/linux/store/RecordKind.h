@@ -11,12 +11,13 @@ namespace halvox::platform::linux_ {
 enum class DropReason : std::uint8_t {
   kDiskFull,
   kLocked,
+  kLogHeld,
   kDamaged,
   kInputOutput,
   kTooLarge,
   kClosed,
 };
-constexpr std::size_t kDropReasons = 6;
+constexpr std::size_t kDropReasons = 7;
 [[nodiscard]] std::string_view counterName(DropReason reason);
 
 // What one transaction may still take.

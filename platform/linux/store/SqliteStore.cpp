@@ -93,7 +93,7 @@ bool SqliteStore::hasTaken() const {
 
 // Opens the database when it is not open, and when its path leads to another file or to none.
 bool SqliteStore::makeReady() {
-  if (database_.isOpen() && files_.identity() == identity_) return true;
+  if (database_.isOpen() && files_.identity() == identity_) return logHasRoom();
   if (database_.isOpen()) {
     kLog.error(files_.database().c_str(), ": the file was removed or replaced, opening it anew");
     abandonDatabase();
@@ -101,6 +101,22 @@ bool SqliteStore::makeReady() {
   const auto error = openDatabase();
   if (!error.has_value()) return true;
   drop(DropReason::kInputOutput, error->description);
+  return false;
+}
+
+// The log cannot begin anew while somebody reads a state of the database that is older than it. A
+// reader that never ends must not fill the disk.
+bool SqliteStore::logHasRoom() {
+  if (files_.logBytes() <= sizes_.databaseBytes) return true;
+  const SqliteCode code = sqlite3_wal_checkpoint_v2(database_.get(), nullptr,
+                                                    SQLITE_CHECKPOINT_RESTART, nullptr, nullptr);
+  if (code == SQLITE_OK) return true;
+  if ((code & 0xFF) == SQLITE_BUSY) {
+    drop(DropReason::kLogHeld,
+         files_.database().native() + ": the log is as large as it may be, and somebody reads it");
+  } else {
+    fail(code, "the log cannot be copied into the database");
+  }
   return false;
 }
 

@@ -76,6 +76,7 @@ class SqliteStore {
   void writeTaken();
   [[nodiscard]] bool hasTaken() const;
   [[nodiscard]] bool makeReady();
+  [[nodiscard]] bool logHasRoom();
   [[nodiscard]] SqliteCode writeTransaction();
   [[nodiscard]] std::optional<StoreError> openDatabase();
   [[nodiscard]] SqliteCode prepareStatements();

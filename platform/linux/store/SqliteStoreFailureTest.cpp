@@ -119,6 +119,26 @@ TEST_F(SqliteStoreFailureTest, GoesOnWhileAReaderHoldsAnOldSnapshot) {
   expectBalance();
 }
 
+TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhenAReaderThatNeverEndsMakesTheLogTooLarge) {
+  options.maxMegabytes = 1;
+  start();
+  send(1);
+  ASSERT_TRUE(allIsStored());
+  Database reader;
+  ASSERT_EQ(reader.open(database(), DatabaseAccess::kReadOnly), SQLITE_OK);
+  ASSERT_EQ(reader.execute("BEGIN; SELECT count(*) FROM analytics_events"), SQLITE_OK);
+  EXPECT_TRUE(eventually([this] {
+    for (std::int64_t number = 0; number < 10'000; ++number) send(number);
+    return counted("dropped: log held by a reader") > 0;
+  }));
+  EXPECT_LT(std::filesystem::file_size(database().native() + "-wal"), 2U << 20U);
+
+  reader.close();
+  EXPECT_TRUE(storesAgain());
+  stop();
+  EXPECT_EQ(counted("received"), counted("stored") + dropped());
+}
+
 TEST_F(SqliteStoreFailureTest, BeginsANewDatabaseWhenTheFileIsDeleted) {
   start();
   send(1);

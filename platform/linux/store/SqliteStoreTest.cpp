@@ -3,6 +3,7 @@
 #include <atomic>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include <sys/stat.h>
@@ -197,6 +198,27 @@ TEST_F(SqliteStoreTest, TheDatabaseIsReadableByOwnerAndGroupOnly) {
   struct stat status {};
   ASSERT_EQ(::stat(database().c_str(), &status), 0);
   EXPECT_EQ(status.st_mode & 0777U, 0640U);
+}
+
+// How often the writer's thread went to sleep so far.
+std::string writerSleeps() {
+  for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
+    if (readFile(task.path() / "comm") != "halvox-store\n") continue;
+    const std::string status = readFile(task.path() / "status");
+    const std::size_t begin = status.find("\nvoluntary_ctxt_switches:");
+    return status.substr(begin, status.find('\n', begin + 1) - begin);
+  }
+  return "there is no such thread";
+}
+
+TEST_F(SqliteStoreTest, DoesNotWakeUpWhileNothingIsSent) {
+  start();
+  send(1);
+  ASSERT_TRUE(allIsStored());
+  std::string sleeps;
+  ASSERT_TRUE(eventually([&] { return std::exchange(sleeps, writerSleeps()) == sleeps; }));
+  std::this_thread::sleep_for(std::chrono::milliseconds(500));  // the idle time that is observed
+  EXPECT_EQ(writerSleeps(), sleeps);
 }
 
 TEST_F(SqliteStoreTest, RaisesBackpressureUnderAFloodAndRelievesItAfterwards) {
