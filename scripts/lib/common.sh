@@ -146,7 +146,8 @@ halvox_progress_in() {
 
 # Runs a command that takes its time: halvox_run WHAT LOG COMMAND...
 # Shows that it goes on: a spinner with the seconds at a terminal, a line every ten seconds
-# elsewhere. When it fails, shows the end of its output and returns its status.
+# elsewhere. When it fails, shows the end of its output and returns its status. The log is only for
+# the time being.
 halvox_run() {
   # shellcheck disable=SC1003  # that is a backslash, no quoting
   local what=$1 log=$2 pid status=0 begin=$SECONDS told=0 ticks=0 spinner='|/-\'
@@ -169,7 +170,9 @@ halvox_run() {
   if ((status != 0)); then
     say "$what: failed (exit status $status); the end of its output:" >&2
     tail -n 30 "$log" >&2
+    rm -f "$log"
     return "$status"
   fi
+  rm -f "$log"
   say "$what: done in $((SECONDS - begin)) s"
 }
