@@ -112,39 +112,12 @@ Value::Value(Dictionary dictionary) noexcept {
   setPayload(std::exchange(dictionary.rep_, nullptr));
 }
 
-Value::Value(const Value& other) noexcept {
-  std::memcpy(storage_, other.storage_, sizeof storage_);
-  retain();
-}
-
-Value::Value(Value&& other) noexcept {
-  std::memcpy(storage_, other.storage_, sizeof storage_);
-  other.setTag(Tag::kNone);
-}
-
-// Retaining before releasing makes assigning a value to itself harmless.
-// NOLINTNEXTLINE(bugprone-unhandled-self-assignment)
-// The new content is taken before the old one goes: `other` may be this value or live inside it.
-Value& Value::operator=(const Value& other) noexcept {
-  Value taken(other);
-  std::swap(storage_, taken.storage_);
-  return *this;
-}
-
-Value& Value::operator=(Value&& other) noexcept {
-  Value taken(std::move(other));
-  std::swap(storage_, taken.storage_);
-  return *this;
-}
-
 // Every counted node starts with its reference count, and an empty container has no node.
 void Value::retain() const noexcept {
-  if (!isCounted()) return;
   if (auto* references = payload<detail::ReferenceCount*>()) detail::retain(*references);
 }
 
 void Value::release() noexcept {
-  if (!isCounted()) return;
   switch (tag()) {
     case Tag::kSharedString: {
       auto* rep = payload<StringRep*>();

@@ -149,11 +149,29 @@ class Value {
   Value(Data data) noexcept;
   Value(Array array) noexcept;
   Value(Dictionary dictionary) noexcept;
-  Value(const Value& other) noexcept;
-  Value(Value&& other) noexcept;
-  Value& operator=(const Value& other) noexcept;
-  Value& operator=(Value&& other) noexcept;
-  ~Value() { release(); }
+  // Copies, moves and ends are written here because every message goes through dozens of them.
+  Value(const Value& other) noexcept {
+    std::memcpy(storage_, other.storage_, sizeof storage_);
+    if (isCounted()) retain();
+  }
+  Value(Value&& other) noexcept {
+    std::memcpy(storage_, other.storage_, sizeof storage_);
+    other.setTag(Tag::kNone);
+  }
+  // The new content is taken before the old one goes: `other` may be this value or live inside it.
+  Value& operator=(const Value& other) noexcept {  // NOLINT(bugprone-unhandled-self-assignment)
+    Value taken(other);
+    std::swap(storage_, taken.storage_);
+    return *this;
+  }
+  Value& operator=(Value&& other) noexcept {
+    Value taken(std::move(other));
+    std::swap(storage_, taken.storage_);
+    return *this;
+  }
+  ~Value() {
+    if (isCounted()) release();
+  }
 
   [[nodiscard]] ValueKind kind() const;
   [[nodiscard]] bool isNumber() const { return kind() == ValueKind::kNumber; }
