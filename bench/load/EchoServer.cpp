@@ -84,6 +84,9 @@ int serveEcho(const std::string& socketPath) {
         if (accepted < 0) continue;
         connections[accepted] = makeBus(accepted);
         watch(poller, accepted, EPOLL_CTL_ADD, EPOLLIN);
+        // Starting the bus has read what the client sent first, so there is something to do
+        // already.
+        if (!serve(poller, accepted, connections.at(accepted).get())) connections.erase(accepted);
       } else if (!serve(poller, fd, connections.at(fd).get())) {
         connections.erase(fd);
       }

@@ -88,6 +88,12 @@ LoadClient::LoadClient(const std::string& socketPath, std::int64_t reporter, boo
   check(sd_bus_new(&bus_), "sd_bus_new");
   check(sd_bus_set_address(bus_, ("unix:path=" + socketPath).c_str()), "address");
   check(sd_bus_start(bus_), "connect");
+  // The echo's library overlooks a message that comes together with the end of the handshake.
+  while (sd_bus_is_ready(bus_) == 0) {
+    const int progress = sd_bus_process(bus_, nullptr);
+    check(progress, "handshake");
+    if (progress == 0) check(sd_bus_wait(bus_, UINT64_MAX), "handshake");
+  }
   if (!withSession) return;
   call("createReportingSession", reporter);
   // A start is answered at the stop; the next call's answer shows that it has been carried out.
