@@ -108,6 +108,7 @@ void ConnectionHost::resume() {
   }
   inbox_->attachToThisThread();
   if (bus_) bus_->start();
+  kLog.info("serving ", listeners_.size(), " sockets", bus_ ? " and a bus" : "");
   static_cast<void>(sd_notify(0, "READY=1"));
   while (!stopping_) takeTurn();
   static_cast<void>(sd_notify(0, "STOPPING=1"));

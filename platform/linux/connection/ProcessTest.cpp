@@ -6,6 +6,7 @@
 #include <memory>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -130,6 +131,9 @@ TEST_F(ProcessTest, ManagerIsToldWhenItServes) {
 }
 
 TEST_F(ProcessTest, ClientsWaitWithoutCostWhenDescriptorsRunOut) {
+#ifdef HALVOX_UNDEFINED_SANITIZER
+  GTEST_SKIP() << "the sanitizer needs descriptors itself to look at an object's type";
+#endif
   std::vector<std::string> limited = command();
   limited.emplace_back("32");
   ChildProcess service(limited);
@@ -163,7 +167,11 @@ TEST_F(ProcessTest, IdleServiceMakesNoWakeUps) {
   }
   const auto wakeUps = [&] { return service.statusNumber("voluntary_ctxt_switches"); };
   long before = wakeUps();
-  ASSERT_TRUE(eventually([&] { return std::exchange(before, wakeUps()) == wakeUps(); }));
+  ASSERT_TRUE(eventually([&] {  // until it has gone to sleep after the last request
+    std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    const long now = wakeUps();
+    return std::exchange(before, now) == now;
+  }));
 
   std::this_thread::sleep_for(std::chrono::seconds(2));  // the idle time that is looked at
 
