@@ -40,7 +40,7 @@ target_link_libraries(halvox_precompiled PRIVATE halvox_flags)
 add_executable(halvox_precompiled_test EXCLUDE_FROM_ALL ${CMAKE_BINARY_DIR}/precompiled/main.cpp)
 target_precompile_headers(halvox_precompiled_test PRIVATE
   ${halvox_common_headers} <gmock/gmock.h> <gtest/gtest.h>)
-target_link_libraries(halvox_precompiled_test PRIVATE halvox_flags)
+target_link_libraries(halvox_precompiled_test PRIVATE halvox_flags GTest::gmock)
 
 # halvox_library(<name> SOURCES <files> [DEPENDS <targets>])
 function(halvox_library name)
