@@ -64,12 +64,12 @@ AnalyticsPayloadBuilder makeBuilder(const Dictionary& message) {
 }
 
 struct Bench {
-  Bench() {
+  explicit Bench(std::uint32_t maxMegabytes = 512) {
     char name[] = "/tmp/halvox-store-bench-XXXXXX";
     directory = ::mkdtemp(name);
-    store =
-        std::make_unique<SqliteStore>(StoreOptions{.directory = directory},
-                                      SqliteStore::Environment{clock, statistics, backpressure});
+    store = std::make_unique<SqliteStore>(
+        StoreOptions{.directory = directory, .maxMegabytes = maxMegabytes},
+        SqliteStore::Environment{clock, statistics, backpressure});
     if (const auto error = store->open()) throw std::runtime_error(error->description);
     service = std::make_unique<SqliteAnalyticsService>(*store, clock);
   }
@@ -108,7 +108,7 @@ double cpuSeconds(int who) {
 // The whole path, all threads: two events stored for each message. The rate is held below what the
 // writer can carry, as backpressure does it, so that callers never wait.
 void storeMessage(benchmark::State& state) {
-  Bench bench;
+  Bench bench(static_cast<std::uint32_t>(state.range(0)));
   const Dictionary message = makeMessage();
   const double before = cpuSeconds(RUSAGE_SELF);
   double caller = 0;
@@ -133,7 +133,14 @@ void storeMessage(benchmark::State& state) {
   state.counters["caller_us_per_message"] = caller / static_cast<double>(messages) * 1e6;
   state.counters["resident_mib"] = static_cast<double>(use.ru_maxrss) / 1024;
 }
-BENCHMARK(storeMessage)->Iterations(8000)->Unit(benchmark::kMicrosecond)->UseRealTime();
+// With room for all, and with old events being deleted all the time.
+BENCHMARK(storeMessage)
+    ->ArgName("megabytes")
+    ->Arg(512)
+    ->Arg(32)
+    ->Iterations(8000)
+    ->Unit(benchmark::kMicrosecond)
+    ->UseRealTime();
 
 // The caller's side alone, while the writer is asleep: two names asked for, two events sent.
 void handOver(benchmark::State& state) {
