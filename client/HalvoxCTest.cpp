@@ -53,8 +53,8 @@ TEST(HalvoxCTest, ACProgramReportsThroughTheSharedLibrary) {
             "destroyReportingSession reporterIDValid");
   const auto calls = service.calls();
   EXPECT_EQ(calls.at(2).arguments.front(), Value(expected));
-  EXPECT_EQ(calls.at(4).arguments, (std::vector<Value>{expected, 4, 1, Array{Array{7}}}));
-  EXPECT_EQ(calls.at(5).arguments, (std::vector<Value>{expected, 4, 2, Array{Array{7, 8}}}));
+  EXPECT_EQ(calls.at(4).arguments, (std::vector<Value>{expected, 4, 1, Array{Value(Array{7})}}));
+  EXPECT_EQ(calls.at(5).arguments, (std::vector<Value>{expected, 4, 2, Array{Value(Array{7, 8})}}));
   EXPECT_EQ(calls.at(6).arguments, (std::vector<Value>{expected, 14, 18, Array{}}));
 }
 

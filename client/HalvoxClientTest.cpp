@@ -48,9 +48,9 @@ TEST_F(HalvoxClientTest, MessagesArriveInOrderWithAllTheyHave) {
   }
   EXPECT_EQ(numbersReceived(), expected);
   const auto calls = service_.calls();
-  EXPECT_EQ(calls[0].arguments.at(3), Value(Array{Array{7}}));
-  EXPECT_EQ(calls[1000].arguments,
-            (std::vector<Value>{Dictionary{{"n", 1000}}, 0x08000004, 65535, Array{Array{7, 8}}}));
+  EXPECT_EQ(calls[0].arguments.at(3), Value(Array{Value(Array{7})}));
+  EXPECT_EQ(calls[1000].arguments, (std::vector<Value>{Dictionary{{"n", 1000}}, 0x08000004, 65535,
+                                                       Array{Value(Array{7, 8})}}));
   EXPECT_EQ(calls[1001].arguments.at(3), Value(Array{}));
   EXPECT_EQ(client.counters().acknowledged, 1002U);
 }

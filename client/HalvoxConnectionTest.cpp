@@ -69,8 +69,8 @@ TEST_F(HalvoxConnectionTest, MessagesArriveWithCategoryTypeAndRecipients) {
   const auto calls = service_.calls();
   ASSERT_EQ(calls.size(), 3U);
   EXPECT_EQ(calls[0].arguments,
-            (std::vector<Value>{Dictionary{{"n", 1}}, 0x08000004, 17, Array{Array{7, 8}}}));
-  EXPECT_EQ(calls[1].arguments.at(3), Value(Array{Array{}}));
+            (std::vector<Value>{Dictionary{{"n", 1}}, 0x08000004, 17, Array{Value(Array{7, 8})}}));
+  EXPECT_EQ(calls[1].arguments.at(3), Value(Array{Value(Array{})}));
   EXPECT_EQ(calls[2].arguments.at(3), Value(Array{}));
 }
 

@@ -7,6 +7,7 @@
 #include <cstdio>
 #include <ctime>
 #include <limits>
+#include <utility>
 #include <vector>
 
 #include <rapidjson/document.h>
@@ -274,7 +275,7 @@ std::string fieldsOfJson(std::string_view json) {
   document.Parse<kParseFlags>(json.data(), json.size());
   if (document.HasParseError() || !document.IsObject()) return harmlessText(json);
   std::string fields;
-  for (const auto& member : document.GetObject()) {
+  for (const auto& member : std::as_const(document).GetObject()) {
     if (!fields.empty()) fields += ' ';
     const auto key = textOf(member.name);
     fields += canStandWithoutQuotes(key) ? harmlessText(key) : harmlessJson(compact(member.name));
