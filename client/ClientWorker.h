@@ -106,7 +106,7 @@ class ClientWorker {
   void sendOperation(const SessionOperation& operation);
   void sendFlush(FlushTicket ticket);
   void sendMessageAtHead();
-  CallOutcome call(Request&& request, OpenCall&& description);
+  CallOutcome call(Request&& request, const OpenCall& description);
   void giveUpWaitingIfOverflowed();
 
   // What comes back.

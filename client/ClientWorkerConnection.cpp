@@ -199,10 +199,10 @@ void ClientWorker::sendMessageAtHead() {
   }
 }
 
-ClientWorker::CallOutcome ClientWorker::call(Request&& request, OpenCall&& description) {
+ClientWorker::CallOutcome ClientWorker::call(Request&& request, const OpenCall& description) {
   auto* message = std::get_if<BusMessage>(&request);
   if (message == nullptr) return CallOutcome::kNoWireForm;
-  OpenCall& opened = open_.emplace_back(std::move(description));
+  OpenCall& opened = open_.emplace_back(description);
   opened.worker = this;
   opened.self = std::prev(open_.end());
   const int result =

@@ -33,7 +33,7 @@ using Request = std::variant<BusMessage, Failure>;
 Request makeRequest(sd_bus* bus, const char* member);
 Request makeRequest(sd_bus* bus, const char* member, ReporterID id);
 Request makeRequest(sd_bus* bus, const SessionOperation& operation);
-Request makeSendMessage(sd_bus* bus, const OutgoingMessage& message);
+Request makeSendMessage(sd_bus* bus, const OutgoingMessage& outgoing);
 
 // The failure that an answer or a negative result of sd_bus_call() stands for.
 Failure failureFromAnswer(sd_bus* bus, sd_bus_message* answer);

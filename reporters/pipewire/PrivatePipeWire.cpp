@@ -63,6 +63,7 @@ ChildProcess::ChildProcess(const std::vector<std::string>& command) {
   posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK);
   posix_spawnattr_setsigmask(&attributes, &noSignals);
   std::vector<char*> arguments;
+  arguments.reserve(command.size() + 1);
   for (const auto& argument : command) {
     arguments.push_back(const_cast<char*>(argument.c_str()));
   }
@@ -149,7 +150,7 @@ std::string PrivatePipeWire::makeTone(double seconds) const {
     const double phase = 2 * std::numbers::pi * kFrequency * i / kRate;
     append(samples, static_cast<std::uint16_t>(std::lround(kAmplitude * std::sin(phase))));
   }
-  const std::string path = directory_ / "tone.wav";
+  std::string path = directory_ / "tone.wav";
   std::ofstream(path, std::ios::binary) << makeWave(samples);
   return path;
 }

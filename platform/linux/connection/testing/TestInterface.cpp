@@ -62,8 +62,10 @@ void answerTrue(ExportedObject& object, Invocation&& invocation) {
 
 void list(ExportedObject& object, Invocation&& invocation) {
   objectOf(object);
+  constexpr int kCount = 1000;
   std::vector<Value> numbers;
-  for (int number = 0; number < 1000; ++number) numbers.emplace_back(number);
+  numbers.reserve(kCount);
+  for (int number = 0; number < kCount; ++number) numbers.emplace_back(number);
   invocation.reply(std::nullopt, Array(numbers));
 }
 
