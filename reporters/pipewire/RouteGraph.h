@@ -18,6 +18,7 @@ struct Route {
   struct Device {
     std::string name;         // the stable node name
     std::string description;  // for people; the name when there is none
+    // The comparison hides a literal 0. NOLINTNEXTLINE(modernize-use-nullptr)
     friend auto operator<=>(const Device&, const Device&) = default;
   };
   std::vector<Device> devices;
