@@ -58,6 +58,9 @@ function(halvox_program name)
   target_link_libraries(${name} PRIVATE ${ARG_DEPENDS} halvox_flags)
 endfunction()
 
+# The tests that ThreadSanitizer runs too.
+add_custom_target(halvox_concurrent_tests)
+
 # halvox_test(<name> SOURCES <files> [DEPENDS <targets>] [LABELS <labels>])
 # A GoogleTest program whose tests CTest lists one by one. Its tests have the label `unit` unless
 # others are given; tests with the label `concurrent` are run under ThreadSanitizer too.
@@ -72,6 +75,9 @@ function(halvox_test name)
   add_executable(${name} ${ARG_SOURCES})
   target_link_libraries(${name} PRIVATE ${ARG_DEPENDS} halvox_flags GTest::gmock GTest::gtest_main)
   target_precompile_headers(${name} REUSE_FROM halvox_precompiled_test)
+  if("concurrent" IN_LIST ARG_LABELS)
+    add_dependencies(halvox_concurrent_tests ${name})
+  endif()
   include(GoogleTest)
   gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST
     PROPERTIES LABELS "${ARG_LABELS}" TIMEOUT 120)
