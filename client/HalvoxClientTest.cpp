@@ -150,6 +150,7 @@ TEST_F(HalvoxClientTest, SendingNeverWaitsForAStalledService) {
   const auto before = std::chrono::steady_clock::now();
   {
     std::vector<std::jthread> threads;
+    threads.reserve(kThreads);
     for (int thread = 0; thread < kThreads; ++thread) {
       threads.emplace_back([&] {
         const Dictionary message{{"n", 1}};

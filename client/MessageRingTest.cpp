@@ -79,6 +79,7 @@ TEST(MessageRingTest, KeepsEachProducersOrderAndLosesNothingThatItTook) {
   constexpr std::int64_t kTaken = 20'000;
   MessageRing ring(37, kPlentyOfBytes);
   std::vector<std::jthread> producers;
+  producers.reserve(kProducers);
   for (int producer = 0; producer < kProducers; ++producer) {
     producers.emplace_back([&ring, producer] {
       for (std::int64_t number = 0; number < kTaken;) {

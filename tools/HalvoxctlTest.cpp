@@ -27,6 +27,7 @@ Outcome runProgram(std::vector<std::string> arguments, const std::string& input 
                    const char* output = nullptr) {
   arguments.insert(arguments.begin(), HALVOXCTL);
   std::vector<char*> pointers;
+  pointers.reserve(arguments.size() + 1);
   for (auto& argument : arguments) pointers.push_back(argument.data());
   pointers.push_back(nullptr);
   int in[2];

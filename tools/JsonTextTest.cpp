@@ -12,7 +12,6 @@ namespace {
 using platform::Array;
 using platform::Dictionary;
 using platform::NumberKind;
-using platform::Value;
 
 Dictionary dictionaryOf(std::string_view json) {
   const auto parsed = parseDictionary(json);
