@@ -7,6 +7,7 @@
 #include <utility>
 #include <variant>
 
+#include <sys/resource.h>
 #include <systemd/sd-daemon.h>
 #include <systemd/sd-id128.h>
 
@@ -36,6 +37,14 @@ ServiceIdentity makeIdentity(const std::string& busName) {
   return identity;
 }
 
+// Every client takes a descriptor; what the system allows this process is more than it starts with.
+void allowMoreDescriptors() {
+  rlimit limit{};
+  if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
+  limit.rlim_cur = limit.rlim_max;
+  static_cast<void>(setrlimit(RLIMIT_NOFILE, &limit));
+}
+
 ConnectionOpenError systemFailure(const std::string& what) {
   return {.kind = ConnectionOpenError::Kind::kSystem,
           .description = what + ": " + std::generic_category().message(errno)};
@@ -61,6 +70,7 @@ ConnectionHost::~ConnectionHost() { shutDown(); }
 std::optional<ConnectionOpenError> ConnectionHost::open() {
   statistics_ = std::make_shared<ConnectionStatistics>(platform::statistics());
   dispatcher_ = std::make_unique<RequestDispatcher>(options_, *statistics_, identity_);
+  allowMoreDescriptors();
   if (auto error = openLoop()) return error;
   if (auto error = openSockets()) return error;
   return openBus();

@@ -75,7 +75,8 @@ class LinuxConnectionService final : public ConnectionService {
   ~LinuxConnectionService() override;
 
   // Makes the socket, or takes the ones passed at start, and connects to the bus. A socket file
-  // that nobody serves any more is replaced. May wait for the bus, a few seconds at most.
+  // that nobody serves any more is replaced. May wait for the bus, a few seconds at most. Lets
+  // the process have as many descriptors as it may.
   [[nodiscard]] std::optional<ConnectionOpenError> open();
 
   NSXPCListener& serviceListener() override;
