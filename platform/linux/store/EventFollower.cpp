@@ -85,13 +85,15 @@ std::optional<StoreError> EventFollower::deliver(const StoreReader::EventCallbac
   return error;
 }
 
-// The database was replaced: its numbers begin anew. Until there is another, nothing is open.
+// The database was replaced: its numbers begin anew. Until there is another, nothing is open. One
+// that is just being made may be refused for any reason, so only the last look's error counts.
 std::optional<StoreError> EventFollower::reopen(bool& isOpen) {
   auto error = reader_.open(directory_);
   isOpen = !error.has_value();
   if (isOpen) filter_.after = 0;
-  if (error.has_value() && error->kind == StoreError::Kind::kMissing) return std::nullopt;
-  return error;
+  const bool isFinal =
+      error.has_value() && error->kind != StoreError::Kind::kMissing && looksLeft_ == 0;
+  return isFinal ? error : std::nullopt;
 }
 
 EventFollower::Change EventFollower::readChanges() {

@@ -96,6 +96,23 @@ TEST_F(EventFollowerTest, GoesOnWithADatabaseThatTookThePlaceOfTheOld) {
   EXPECT_THAT(seen, ElementsAre(numbered(1), numbered(2)));
 }
 
+TEST_F(EventFollowerTest, WaitsForTheNewDatabaseWhileThereIsNone) {
+  start();
+  ASSERT_EQ(follower.open(options.directory, {}), std::nullopt);
+  send(1);
+  ASSERT_TRUE(follow(1));
+  stop();
+  std::filesystem::remove(database());
+  for (int look = 0; look < 3; ++look) {
+    writeFile(options.directory / "halvox.db-other", "wakes the follower");
+    ASSERT_TRUE(follow(0));
+  }
+  start();
+  send(2);
+  ASSERT_TRUE(follow(2));
+  EXPECT_THAT(seen, ElementsAre(numbered(1), numbered(2)));
+}
+
 TEST_F(EventFollowerTest, IsQuietWhileNothingIsWritten) {
   start();
   send(1);

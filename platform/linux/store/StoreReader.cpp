@@ -87,6 +87,7 @@ SqliteCode StoreReader::openFile() {
 
 std::optional<StoreError> StoreReader::forEachEvent(const EventFilter& filter,
                                                     const EventCallback& callback) {
+  if (!database_.isOpen()) return StoreError{StoreError::Kind::kMissing, "no store is open"};
   EventScan scan(database_, filter);
   SqliteCode code = scan.begin();
   EventScan::Piece piece;
@@ -101,7 +102,7 @@ std::optional<StoreError> StoreReader::forEachEvent(const EventFilter& filter,
 }
 
 bool StoreReader::isReplaced() const {
-  return !files_.has_value() || files_->identity() != identity_;
+  return !database_.isOpen() || files_->identity() != identity_;
 }
 
 StoreError StoreReader::failure(SqliteCode code) const {

@@ -49,7 +49,7 @@ class StoreReader {
   [[nodiscard]] std::optional<StoreError> forEachEvent(const EventFilter& filter,
                                                        const EventCallback& callback);
 
-  // True when the store's path leads to another database than the one that is open, or to none;
+  // True when none is open, or the store's path leads to another database than it did, or to none;
   // then opening again helps, and event numbers may begin anew.
   [[nodiscard]] bool isReplaced() const;
 

@@ -144,6 +144,15 @@ TEST_F(StoreReaderTest, DoesNotHoldASnapshotDuringTheCallback) {
   EXPECT_THAT(read({.newest = 1}), ElementsAre(numbered(99)));
 }
 
+TEST_F(StoreReaderTest, ReadsNothingAfterAFailedOpening) {
+  StoreReader reader;
+  ASSERT_TRUE(reader.open(options.directory).has_value());
+  const auto error =
+      reader.forEachEvent({}, [](const StoredEvent&) { FAIL() << "there is no event"; });
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->kind, StoreError::Kind::kMissing);
+}
+
 TEST_F(StoreReaderTest, SaysThatThereIsNoStore) {
   EXPECT_EQ(openError(), StoreError::Kind::kMissing);
 }
