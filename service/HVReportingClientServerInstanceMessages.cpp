@@ -63,7 +63,9 @@ std::int32_t roundedSeconds(std::chrono::duration<double> time) {
       std::clamp<double>(std::round(time.count()), Limits::min(), Limits::max()));
 }
 
-// Marks the message with the time of its arrival, in the place of whatever the client sent.
+// Marks the message with the time of its arrival. Whatever the client sent under these keys goes
+// first, so that the stamps come last and also win over keys that become theirs when blanks are
+// replaced.
 void stamp(platform::Message& message) {
   static const platform::Key timestamp("hvreporting_timestamp");
   static const platform::Key systemUptime("systemuptime_sec");
@@ -71,6 +73,7 @@ void stamp(platform::Message& message) {
   constexpr std::size_t kStamps = 3;
   if (!message.has_value()) return;
   const platform::ClockService& clock = platform::clock();
+  for (const platform::Key& key : {timestamp, systemUptime, processUptime}) message->remove(key);
   message->reserve(message->size() + kStamps);
   message->set(timestamp, clock.currentDate().secondsSince1970);
   message->set(systemUptime, roundedSeconds(clock.systemUptime()));

@@ -125,6 +125,14 @@ TEST_F(HVReportingClientServerInstanceMessagesTest, StampsReplaceWhatTheClientSe
   EXPECT_EQ(recorded(client_, 7), expected);
 }
 
+TEST_F(HVReportingClientServerInstanceMessagesTest, StampsWinOverKeysThatBecomeTheirs) {
+  createAndStart(client_, 7);
+
+  send(client_, {7}, {{"hvreporting_timestamp", 1}, {"hvreporting timestamp", 2}});
+
+  EXPECT_EQ(*recorded(client_, 7).find("hvreporting_timestamp"), Value(1000.25));
+}
+
 TEST_F(HVReportingClientServerInstanceMessagesTest, TheStampIsTheTimeWhenTheRequestIsCarriedOut) {
   createAndStart(client_, 7);
   const std::vector<Value> ids{Array{7}};

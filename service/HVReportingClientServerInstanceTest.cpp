@@ -117,6 +117,7 @@ TEST_F(HVReportingClientServerInstanceTest, ADeadProcessLeavesOnlyTheCounterBehi
   EXPECT_EQ(call(other_, "getAllReporters", {})->value(), Value(Array{9}));
   EXPECT_EQ(delegate_->activeSessionCount(), 1);
   EXPECT_FALSE(started->isAnswered());
+  EXPECT_TRUE(platform_.log.containsText("ending session 7"));
   EXPECT_TRUE(platform_.log.containsText("dealloc 100 from the server client list"));
 }
 

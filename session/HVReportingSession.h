@@ -132,7 +132,9 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   // Single values; a reader on another thread that sees one a little late is no harm.
   std::atomic<AudioServiceType> serviceType_{AudioServiceType::kUnknown};
   std::atomic<bool> tlmReportingEnabled_{false};
-  std::atomic<bool> started_{false};  // released by start and stop after the history is in place
+  // Set before the history is made and cleared after it is gone: a reader that sees it set may
+  // still find no history, and then records nothing.
+  std::atomic<bool> started_{false};
 };
 
 }  // namespace halvox

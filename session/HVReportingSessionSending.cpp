@@ -79,6 +79,7 @@ bool HVReportingSession::createMessageIdentifierWithCategory(const HistoryLock& 
   if (previous != nullptr && !isExemptFromSuppression(category, type) &&
       equalApartFromVolatileKeys(*previous, message)) {
     kSessionLog.debug("dropping redundant event");
+    charge(before, messages.memorySize());  // a base may be known by one more code now
     return true;
   }
   messages.append(base, message);

@@ -221,15 +221,6 @@ TEST_F(HVReportingSessionSendingTest, CountsOfMessagesBalance) {
                                    Pair("not recorded: not started", 1U)));
 }
 
-TEST_F(HVReportingSessionSendingTest, AStartedSessionSubmitsNothing) {
-  session_->setTlmReportingEnabled(true);
-
-  send({{"a", 1}});
-
-  EXPECT_THAT(platform_.dispatch.createdQueues(), IsEmpty());
-  EXPECT_EQ(platform_.dispatch.waitingJobs(), 0U);
-}
-
 TEST_F(HVReportingSessionSendingTest, ASessionWithoutTheLinkSubmitsNothing) {
   session_->stop();
 

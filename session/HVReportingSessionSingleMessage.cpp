@@ -95,7 +95,7 @@ void refuse(const ErrorReply& reply) {
   if (pendingBytes().isNewBurst()) {
     kSessionLog.error("too many single messages are waiting, dropping some");
   }
-  if (reply) reply(std::nullopt);
+  if (reply) reply(platform::Error{.description = "too many single messages are waiting"});
 }
 
 }  // namespace

@@ -114,6 +114,7 @@ TEST_F(HVReportingSessionSingleMessageTest, AFloodIsDroppedPastABoundAndLoggedOn
   EXPECT_EQ(platform_.dispatch.delayedJobs() + dropped, 40U);
   EXPECT_GE(dropped, 8U);
   EXPECT_EQ(replies.size(), dropped);
+  EXPECT_TRUE(std::ranges::all_of(replies, [](const auto& error) { return error.has_value(); }));
   EXPECT_THAT(platform_.log.texts(LogLevel::kError),
               ElementsAre("too many single messages are waiting, dropping some"));
 }

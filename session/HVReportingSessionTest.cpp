@@ -353,6 +353,24 @@ TEST_F(HVReportingSessionTest, StopGivesTheHistoryBackAndDestructionTheRest) {
   EXPECT_EQ(account->use().bytes, 0U);
 }
 
+// Codes without a text of their own share the base of "Undefined", and a repetition under a second
+// such code records nothing but the code.
+TEST_F(HVReportingSessionTest, RepetitionsUnderAnotherCodeOfTheSameTextAreChargedToo) {
+  const auto account = std::make_shared<ResourceAccount>();
+  const auto session = makeSession();
+  session->chargeTo(account);
+  session->start();
+  const Dictionary message{{"a", 1}};
+  const auto type = AudioEventType::kStart;
+
+  session->sendMessage(message, static_cast<AudioEventCategory>(16), type, nullptr);
+  session->sendMessage(message, static_cast<AudioEventCategory>(17), type, nullptr);
+
+  EXPECT_EQ(account->use().bytes, (*session->nestedAggregatedPayloadData())->memorySize());
+  session->stop();
+  EXPECT_EQ(account->use().bytes, 0U);
+}
+
 // Runs under ThreadSanitizer: payloads are built from sessions on other threads.
 TEST_F(HVReportingSessionTest, PropertiesMayBeReadWhileTheyAreWritten) {
   const auto session = makeSession();

@@ -116,6 +116,8 @@ LinuxPlatform::LinuxPlatform(const Configuration& configuration)
           backpressure_),
       kdebug_(makeKdebug(kdebugFailure_)),
       log_(SpdlogLogService::onStandardError(configuration_.logLevel, statistics_)),
+      // Its last line tells why the process ended.
+      process_([this] { log_->stop(); }),
       deviceProperties_(configuration_.device),
       featureFlags_(configuration_.features),
       store_(storeOptions(configuration_), {clock_, statistics_, backpressure_}),

@@ -173,6 +173,7 @@ class ProtocolTests:
             self.assertEqual(service_process(service).wait(harness.DEADLINE), 2)
             with self.assertRaises(GLib.Error):
                 pending.wait()
+            self.assertIn("DESTROYING SERVICE", service.log())
 
 
 def service_process(service):

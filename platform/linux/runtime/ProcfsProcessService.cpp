@@ -45,6 +45,9 @@ std::string ProcfsProcessService::ownProcessName() const {
   return readCommandName("/proc/self/comm").value_or("");
 }
 
-void ProcfsProcessService::terminate(int exitStatus) { ::_exit(exitStatus); }
+void ProcfsProcessService::terminate(int exitStatus) {
+  if (beforeEnd_) beforeEnd_();
+  ::_exit(exitStatus);
+}
 
 }  // namespace halvox::platform::linux_
