@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <iterator>
+#include <string>
 #include <string_view>
 #include <utility>
 
@@ -21,6 +22,10 @@ using platform::Value;
 constexpr std::string_view kInterfaceName = "com.tarno.halvox.HVReportingServiceProtocol";
 constexpr std::string_view kObjectPath = "/com/tarno/halvox/reporting";
 constexpr std::string_view kInvalidArguments = "org.freedesktop.DBus.Error.InvalidArgs";
+constexpr std::string_view kLimitsExceeded = "org.freedesktop.DBus.Error.LimitsExceeded";
+// One message to so many sessions holds the others up for some hundredths of a second. Nobody has a
+// use for more: a message without a list reaches all active sessions.
+constexpr std::size_t kMaxReporterIDs = 10'000;
 
 HVReportingServiceProtocol& service(ExportedObject& object) {
   return static_cast<HVReportingServiceProtocol&>(object);
@@ -101,7 +106,17 @@ void invokeSendMessage(ExportedObject& object, Invocation&& request) {
     return;
   }
   HVReportingServiceProtocol::ReporterIDs reporters;
-  if (!lists.empty()) reporters = reporterIDs(lists[0].array());
+  if (!lists.empty()) {
+    const Array ids = lists[0].array();
+    if (ids.size() > kMaxReporterIDs) {
+      request.reply(Error{.description = "sendMessage: argument 4: more than " +
+                                         std::to_string(kMaxReporterIDs) + " reporter IDs",
+                          .name = std::string(kLimitsExceeded)},
+                    Value());
+      return;
+    }
+    reporters = reporterIDs(ids);
+  }
   service(object).sendMessage(request.arguments[0].dictionary(),
                               enumeration<AudioEventCategory>(request.arguments[1]),
                               enumeration<AudioEventType>(request.arguments[2]),

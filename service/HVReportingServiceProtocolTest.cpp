@@ -80,6 +80,19 @@ TEST_F(HVReportingServiceProtocolTest, AMessageIsAnsweredWithNothing) {
   EXPECT_THAT(send(client_, {})->replies(), ElementsAre(ok(Value())));
 }
 
+TEST_F(HVReportingServiceProtocolTest, AnEndlessListOfReporterIDsIsRefused) {
+  createAndStart(client_, 7);
+  const std::vector<Value> ids(10'001, Value(std::int64_t{7}));
+
+  const Call call = post(client_, "sendMessage",
+                         {Dictionary{{"a", 1}}, kCategory, kType, Array{Value(Array(ids))}});
+
+  ASSERT_EQ(call->replies().size(), 1U);
+  ASSERT_TRUE(call->replies()[0].error.has_value());
+  EXPECT_EQ(call->replies()[0].error->name, "org.freedesktop.DBus.Error.LimitsExceeded");
+  EXPECT_EQ(platform_.dispatch.waitingJobs(), 0U);
+}
+
 TEST_F(HVReportingServiceProtocolTest, MoreThanOneListOfReporterIDsIsRefused) {
   createAndStart(client_, 7);
 

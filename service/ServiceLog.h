@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <string>
 
 #include "backends/HVReportingVocabulary.h"
@@ -12,6 +13,10 @@ namespace halvox {
 inline constexpr platform::UnitLog kServiceLog(&HVReportingServiceDelegateCategory,
                                                "HVReportingServiceDelegate");
 
+// A log line ends about here whatever is in it, so what a list has beyond is only counted: with
+// thousands of sessions, describing them would cost more than all else that a start does.
+inline constexpr std::size_t kMaxListText = 8192;
+
 // A list as log lines show it: "(first, second)". Put together only when the line is written.
 // `Append` adds one element to a text. Refers to the list, which must outlive it.
 template <typename List, typename Append>
@@ -21,9 +26,15 @@ class ListDescription {
 
   [[nodiscard]] std::string description() const {
     std::string text = "(";
+    std::size_t left = list_.size();
     for (const auto& element : list_) {
+      if (text.size() > kMaxListText) {
+        text += ", and " + std::to_string(left) + " more";
+        break;
+      }
       if (text.size() > 1) text += ", ";
       append_(text, element);
+      --left;
     }
     text += ')';
     return text;

@@ -1,3 +1,4 @@
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
@@ -56,6 +57,9 @@ int run(int argumentCount, char** arguments) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  // A reader of the log that went away and a file that may not grow are errors to count, no ends.
+  std::signal(SIGPIPE, SIG_IGN);
+  std::signal(SIGXFSZ, SIG_IGN);
   try {
     return run(argc, argv);
   } catch (const std::exception& error) {

@@ -23,7 +23,7 @@ constexpr const char* kSessionNote =
 constexpr const char* kScriptNote =
     "The lines are as the arguments of halvoxctl, quoted as in a shell; a JSON object at the end "
     "of "
-    "a line needs no quotes. # begins a comment.\nBesides the requests there are 'wait ID "
+    "a line needs no quotes. # begins a comment line.\nBesides the requests there are 'wait ID "
     "[SECONDS]' (for the answer to a start) and 'sleep SECONDS'.\nEnds at the first line that "
     "fails, with its status.";
 

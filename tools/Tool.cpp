@@ -21,7 +21,9 @@ ExitStatus runFile(const RunScript& script, const CommonOptions& options,
                      streams.output, streams.errors);
   }
   std::ifstream file(script.file);
-  if (!file) {
+  // A directory opens but cannot be read.
+  if (file) (void)file.peek();
+  if (file.bad() || !file.is_open()) {
     streams.errors << "halvoxctl run: FILE: cannot read " << harmlessText(script.file) << ": "
                    << std::strerror(errno) << '\n';
     return ExitStatus::kBadArguments;

@@ -223,6 +223,8 @@ void AnalyticsRecords::endTransaction() {
 }
 
 std::uint64_t AnalyticsRecords::dropTaken(DropReason reason) {
+  // Waiting for a locked file must not look like slow writing, or callers would have to wait too.
+  queue_.disregardTime();
   nextRecordID_ = nextCommittedRecordID_;
   span_ = {};
   ++generation_;

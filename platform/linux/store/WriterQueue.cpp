@@ -57,6 +57,11 @@ void WriterQueue::finish(std::uint64_t records, std::uint64_t bytes) {
   if (relieve) backpressure_.relieve();
 }
 
+void WriterQueue::disregardTime() {
+  const MutexLock lock(mutex_);
+  workingSince_ = std::chrono::steady_clock::now();
+}
+
 bool WriterQueue::hasQueued() {
   const MutexLock lock(mutex_);
   return queued_ > 0;

@@ -60,6 +60,8 @@ class WriterQueue {
   // The writer: so many of the taken records are done with; `bytes` were in their payloads. It was
   // at work on them since the last call of this or of take().
   void finish(std::uint64_t records, std::uint64_t bytes) HALVOX_EXCLUDES(mutex_);
+  // The writer: the time since then went by in a failure and says nothing about writing.
+  void disregardTime() HALVOX_EXCLUDES(mutex_);
   // The writer: whether records came since the last take().
   [[nodiscard]] bool hasQueued() HALVOX_EXCLUDES(mutex_);
 

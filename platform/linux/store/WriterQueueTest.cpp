@@ -78,6 +78,20 @@ TEST(WriterQueueTest, HoldsFewerRecordsWhenTheirPayloadsAreLarge) {
   EXPECT_TRUE(backpressure.isHigh());
 }
 
+TEST(WriterQueueTest, HoldsAsManyRecordsWhenTimeWentByInAFailure) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  addMany(queue, 1);
+  ASSERT_TRUE(queue.take(soon(), [] {}));
+  std::this_thread::sleep_for(kSmall.softTime);  // the failure
+  queue.disregardTime();
+  queue.finish(1, 0);
+
+  addMany(queue, kSmall.softRecords - 1);
+
+  EXPECT_FALSE(backpressure.isHigh());
+}
+
 TEST(WriterQueueTest, HoldsFewerRecordsWhenWritingIsSlow) {
   Backpressure backpressure;
   WriterQueue queue(kSmall, backpressure);
