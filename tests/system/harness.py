@@ -31,6 +31,8 @@ BUS_NAME = "com.tarno.halvox.reporting"
 OBJECT = "/com/tarno/halvox/reporting"
 UPTIME_EVENT = "com.tarno.halvox.hvreportingclientuptime"
 INTERFACE = "com.tarno.halvox.HVReportingServiceProtocol"
+# Whatever ends a test, also a time-out that kills it, ends what it started.
+WITH_US = ["setpriv", "--pdeathsig", "KILL", "--"]
 DEADLINE = 30.0  # seconds; generous, for sanitizer builds on a busy machine
 
 PLAYBACK = 4
@@ -118,7 +120,7 @@ class Service:
         try:
             with open(self.log_path, "ab") as log:
                 self.process = subprocess.Popen(
-                    self._command,
+                    WITH_US + self._command,
                     env={**self._environment, "NOTIFY_SOCKET": notify.path},
                     stdin=subprocess.DEVNULL, stdout=log, stderr=log,
                 )
@@ -333,7 +335,7 @@ def private_bus():
     """A message bus of our own; gives its address."""
     directory = tempfile.mkdtemp(prefix="halvox-bus-")
     process = subprocess.Popen(
-        ["dbus-daemon", "--session", "--nofork", "--print-address=1",
+        [*WITH_US, "dbus-daemon", "--session", "--nofork", "--print-address=1",
          f"--address=unix:path={directory}/bus"],
         stdout=subprocess.PIPE, stderr=subprocess.DEVNULL, text=True,
     )
