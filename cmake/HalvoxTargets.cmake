@@ -79,9 +79,14 @@ function(halvox_test name)
     add_dependencies(halvox_concurrent_tests ${name})
   endif()
   include(GoogleTest)
+  # Discovery loses all labels of a list but the first, so they become one, which `ctest -L` finds by
+  # any of its parts: unit-concurrent.
+  string(REPLACE ";" "-" labels "${ARG_LABELS}")
   gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST
-    PROPERTIES LABELS "${ARG_LABELS}" TIMEOUT 120)
+    PROPERTIES LABELS "${labels}" TIMEOUT 120)
 endfunction()
+
+add_custom_target(halvox_fuzzers)
 
 # halvox_fuzzer(<name> SOURCES <files> [DEPENDS <targets>])
 # A libFuzzer program with the `fuzz` preset; elsewhere the same entry point is linked with a driver
@@ -92,6 +97,7 @@ function(halvox_fuzzer name)
   if(HALVOX_FUZZ)
     add_executable(${name} ${ARG_SOURCES})
     target_link_options(${name} PRIVATE -fsanitize=fuzzer)
+    add_dependencies(halvox_fuzzers ${name})
   else()
     add_executable(${name} ${ARG_SOURCES} ${CMAKE_SOURCE_DIR}/tests/fuzz/SeedDriver.cpp)
     add_test(NAME fuzz_seeds.${name} COMMAND ${name} ${seeds})
