@@ -31,9 +31,7 @@ class UnusedAnalyticsService final : public platform::AnalyticsService {
 TEST(HVReportingTallyhubBridgeAllocationTest, AMessageThatNobodyCollectsAllocatesNothing) {
   platform::FakePlatform fakes;
   UnusedAnalyticsService analytics;
-  platform::installServices({analytics, fakes.clock, fakes.connections, fakes.deviceProperties,
-                             fakes.dispatch, fakes.featureFlags, fakes.kdebug, fakes.log,
-                             fakes.process, fakes.statistics});
+  platform::installServices(fakes.servicesWith(analytics));
   const auto session = std::make_shared<HVReportingSession>(
       ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
   const platform::Message message = platform::Dictionary{{"a", 1}};

@@ -13,6 +13,7 @@
 #include "platform/connection.h"
 #include "platform/device_properties.h"
 #include "platform/dispatch.h"
+#include "platform/fake/AbsentServices.h"
 #include "platform/feature_flags.h"
 #include "platform/kdebug.h"
 #include "platform/log.h"
@@ -167,15 +168,29 @@ struct NullPlatform {
                                .clock = clock,
                                .connections = connections,
                                .deviceProperties = deviceProperties,
+                               .diagnosticReporters = diagnosticReporters,
                                .dispatch = dispatch,
                                .featureFlags = featureFlags,
+                               .files = files,
                                .kdebug = kdebug,
                                .log = log,
+                               .metrics = metrics,
+                               .notify = notify,
+                               .powerLog = powerLog,
+                               .preferences = preferences,
                                .process = process,
-                               .statistics = statistics});
+                               .statistics = statistics,
+                               .tlmReporting = tlmReporting});
   }
 
   NullAnalytics analytics;
+  platform::AbsentDiagnosticReporters diagnosticReporters;
+  platform::AbsentFiles files;
+  platform::AbsentMetrics metrics;
+  platform::AbsentNotify notify;
+  platform::AbsentPowerLog powerLog;
+  platform::AbsentPreferences preferences;
+  platform::AbsentTlmReporting tlmReporting;
   SteppingClock clock;
   NullConnections connections;
   NullDeviceProperties deviceProperties;

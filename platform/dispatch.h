@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string_view>
 
 namespace halvox::platform {
@@ -19,6 +20,16 @@ enum class QueueThreading : std::uint8_t { kOwnThread, kShared };
 // thread that must not stand still may carry it out too.
 enum class JobWeight : std::uint8_t { kBrief, kMayBlock };
 
+// Counts signals that wait to be consumed. Any thread may signal; a signal that nobody waits for
+// stays. Whoever holds it keeps it, and queues that wait on it keep it too.
+class DispatchSemaphore {
+ public:
+  virtual ~DispatchSemaphore() = default;
+  virtual void signal() = 0;
+};
+
+enum class WaitOutcome : std::uint8_t { kSignalled, kTimedOut };
+
 // Runs its jobs one at a time, in the order in which they came. Any thread may add jobs.
 // Jobs that are waiting when the process ends are not run.
 class DispatchQueue {
@@ -27,6 +38,14 @@ class DispatchQueue {
 
   // Adds a job and returns at once; the job never runs before this returns.
   virtual void async(JobWeight weight, Job job) = 0;
+  // Waits on a semaphore of the same service without holding a thread. Called by a job of this
+  // queue, at most once and as the last thing it does: the queue runs no other job until there was
+  // a signal, which is consumed, or the time-out has passed (none: never). Then it runs `then`,
+  // before the jobs that wait; `then` is a job like any other and may wait again. For shared
+  // queues only.
+  virtual void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
+                      std::optional<std::chrono::nanoseconds> timeout,
+                      std::function<void(WaitOutcome)> then);
   // True on the thread that is running a job of this queue right now.
   [[nodiscard]] virtual bool isCurrent() const = 0;
 };
@@ -41,6 +60,8 @@ class DispatchService {
   virtual std::shared_ptr<DispatchQueue> createSerialQueue(std::string_view label,
                                                            QualityOfService quality,
                                                            QueueThreading threading) = 0;
+  // A new semaphore with that many signals in it.
+  virtual std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals);
   // Runs the job on the background-priority global queue after that delay, in no order with
   // others. Costs no thread while it waits.
   virtual void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) = 0;

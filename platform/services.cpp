@@ -28,11 +28,18 @@ AnalyticsService& analytics() { return installed().analytics; }
 ClockService& clock() { return installed().clock; }
 ConnectionService& connections() { return installed().connections; }
 DevicePropertyService& deviceProperties() { return installed().deviceProperties; }
+DiagnosticReporterService& diagnosticReporters() { return installed().diagnosticReporters; }
 DispatchService& dispatch() { return installed().dispatch; }
 FeatureFlagService& featureFlags() { return installed().featureFlags; }
+FileService& files() { return installed().files; }
 KdebugService& kdebug() { return installed().kdebug; }
 LogService& log() { return installed().log; }
+MetricService& metrics() { return installed().metrics; }
+NotifyService& notify() { return installed().notify; }
+PowerLogService& powerLog() { return installed().powerLog; }
+PreferenceService& preferences() { return installed().preferences; }
 ProcessService& process() { return installed().process; }
 StatisticsService& statistics() { return installed().statistics; }
+TLMReportingService& tlmReporting() { return installed().tlmReporting; }
 
 }  // namespace halvox::platform

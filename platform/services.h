@@ -6,12 +6,19 @@ class AnalyticsService;
 class ClockService;
 class ConnectionService;
 class DevicePropertyService;
+class DiagnosticReporterService;
 class DispatchService;
 class FeatureFlagService;
+class FileService;
 class KdebugService;
 class LogService;
+class MetricService;
+class NotifyService;
+class PowerLogService;
+class PreferenceService;
 class ProcessService;
 class StatisticsService;
+class TLMReportingService;
 
 // The platform services that the system asks for everything outside itself. Whoever makes the set
 // owns the services and keeps them until no other thread runs any more.
@@ -20,12 +27,19 @@ struct Services {
   ClockService& clock;
   ConnectionService& connections;
   DevicePropertyService& deviceProperties;
+  DiagnosticReporterService& diagnosticReporters;
   DispatchService& dispatch;
   FeatureFlagService& featureFlags;
+  FileService& files;
   KdebugService& kdebug;
   LogService& log;
+  MetricService& metrics;
+  NotifyService& notify;
+  PowerLogService& powerLog;
+  PreferenceService& preferences;
   ProcessService& process;
   StatisticsService& statistics;
+  TLMReportingService& tlmReporting;
 };
 
 // Installs the services: once, before anything else, on the only thread. Tests install a new set
@@ -37,11 +51,18 @@ AnalyticsService& analytics();
 ClockService& clock();
 ConnectionService& connections();
 DevicePropertyService& deviceProperties();
+DiagnosticReporterService& diagnosticReporters();
 DispatchService& dispatch();
 FeatureFlagService& featureFlags();
+FileService& files();
 KdebugService& kdebug();
 LogService& log();
+MetricService& metrics();
+NotifyService& notify();
+PowerLogService& powerLog();
+PreferenceService& preferences();
 ProcessService& process();
 StatisticsService& statistics();
+TLMReportingService& tlmReporting();
 
 }  // namespace halvox::platform

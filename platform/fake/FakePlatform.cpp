@@ -1,20 +1,27 @@
 #include "platform/fake/FakePlatform.h"
 
-#include "platform/services.h"
-
 namespace halvox::platform {
 
-FakePlatform::FakePlatform() {
-  installServices({.analytics = analytics,
-                   .clock = clock,
-                   .connections = connections,
-                   .deviceProperties = deviceProperties,
-                   .dispatch = dispatch,
-                   .featureFlags = featureFlags,
-                   .kdebug = kdebug,
-                   .log = log,
-                   .process = process,
-                   .statistics = statistics});
+FakePlatform::FakePlatform() { installServices(servicesWith(analytics)); }
+
+Services FakePlatform::servicesWith(AnalyticsService& otherAnalytics) {
+  return {.analytics = otherAnalytics,
+          .clock = clock,
+          .connections = connections,
+          .deviceProperties = deviceProperties,
+          .diagnosticReporters = diagnosticReporters,
+          .dispatch = dispatch,
+          .featureFlags = featureFlags,
+          .files = files,
+          .kdebug = kdebug,
+          .log = log,
+          .metrics = metrics,
+          .notify = notify,
+          .powerLog = powerLog,
+          .preferences = preferences,
+          .process = process,
+          .statistics = statistics,
+          .tlmReporting = tlmReporting};
 }
 
 FakePlatform::~FakePlatform() {

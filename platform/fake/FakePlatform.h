@@ -1,5 +1,6 @@
 #pragma once
 
+#include "platform/fake/AbsentServices.h"
 #include "platform/fake/FakeAnalyticsService.h"
 #include "platform/fake/FakeClockService.h"
 #include "platform/fake/FakeConnectionService.h"
@@ -11,6 +12,7 @@
 #include "platform/fake/FakeProcessService.h"
 #include "platform/fake/FakeStatisticsService.h"
 #include "platform/fake/Journal.h"
+#include "platform/services.h"
 
 namespace halvox::platform {
 
@@ -24,6 +26,9 @@ struct FakePlatform {
   // destructors of what they held may call them.
   ~FakePlatform();
 
+  // The fakes with another analytics service, for a test that installs its own.
+  [[nodiscard]] Services servicesWith(AnalyticsService& otherAnalytics);
+
   Journal journal;
   FakeClockService clock;
   FakeLogService log{journal};
@@ -33,6 +38,13 @@ struct FakePlatform {
   FakeDevicePropertyService deviceProperties;
   FakeFeatureFlagService featureFlags;
   FakeAnalyticsService analytics{journal};
+  AbsentDiagnosticReporters diagnosticReporters;
+  AbsentFiles files;
+  AbsentMetrics metrics;
+  AbsentNotify notify;
+  AbsentPowerLog powerLog;
+  AbsentPreferences preferences;
+  AbsentTlmReporting tlmReporting;
   FakeDispatchService dispatch{clock};
   FakeConnectionService connections{journal};
 };

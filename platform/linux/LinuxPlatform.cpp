@@ -129,12 +129,19 @@ Services LinuxPlatform::services() {
           .clock = clock_,
           .connections = connections_,
           .deviceProperties = deviceProperties_,
+          .diagnosticReporters = diagnosticReporters_,
           .dispatch = dispatch_,
           .featureFlags = featureFlags_,
+          .files = files_,
           .kdebug = *kdebug_,
           .log = *log_,
+          .metrics = metrics_,
+          .notify = notify_,
+          .powerLog = powerLog_,
+          .preferences = preferences_,
           .process = process_,
-          .statistics = statistics_};
+          .statistics = statistics_,
+          .tlmReporting = tlmReporting_};
 }
 
 std::optional<StartFailure> LinuxPlatform::open() {

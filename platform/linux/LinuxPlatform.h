@@ -4,6 +4,7 @@
 #include <optional>
 #include <string>
 
+#include "platform/fake/AbsentServices.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
 #include "platform/linux/runtime/AsioDispatchService.h"
 #include "platform/linux/runtime/Backpressure.h"
@@ -65,6 +66,13 @@ class LinuxPlatform {
   ConfiguredFeatureFlagService featureFlags_;
   SqliteStore store_;
   SqliteAnalyticsService analytics_;
+  AbsentDiagnosticReporters diagnosticReporters_;
+  AbsentFiles files_;
+  AbsentMetrics metrics_;
+  AbsentNotify notify_;
+  AbsentPowerLog powerLog_;
+  AbsentPreferences preferences_;
+  AbsentTlmReporting tlmReporting_;
   AsioDispatchService dispatch_;
 };
 
