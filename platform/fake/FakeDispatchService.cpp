@@ -1,5 +1,6 @@
 #include "platform/fake/FakeDispatchService.h"
 
+#include <algorithm>
 #include <stdexcept>
 #include <utility>
 
@@ -35,6 +36,20 @@ void FakeDispatchQueue::async(JobWeight weight, Job job) {
 
 bool FakeDispatchQueue::isCurrent() const { return runningQueue == this; }
 
+void FakeDispatchQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
+                               std::optional<std::chrono::nanoseconds> timeout,
+                               std::function<void(WaitOutcome)> then) {
+  if (!isCurrent()) throw std::logic_error("a wait began outside the jobs of its queue");
+  if (traits_.threading != QueueThreading::kShared) {
+    throw std::logic_error("a queue with a thread of its own was to wait");
+  }
+  auto own = std::dynamic_pointer_cast<FakeDispatchSemaphore>(std::move(semaphore));
+  if (own == nullptr) throw std::logic_error("a semaphore of another service");
+  service_.beginWait({shared_from_this(), std::move(own), timeout, std::move(then)});
+}
+
+void FakeDispatchSemaphore::signal() { service_.signal(*this); }
+
 FakeDispatchService::~FakeDispatchService() { clear(); }
 
 void FakeDispatchService::runUntilIdle() {
@@ -46,9 +61,11 @@ bool FakeDispatchService::runOne() {
   Waiting next;
   {
     const std::lock_guard lock(mutex_);
-    if (waiting_.empty()) return false;
-    next = std::move(waiting_.front());
-    waiting_.pop_front();
+    const auto first = std::ranges::find_if(
+        waiting_, [](const Waiting& waiting) { return !waiting.queue->isWaiting_; });
+    if (first == waiting_.end()) return false;
+    next = std::move(*first);
+    waiting_.erase(first);
   }
   const RunningMark mark(next.queue.get());
   next.job();
@@ -59,26 +76,55 @@ bool FakeDispatchService::runOne() {
 void FakeDispatchService::advance(std::chrono::nanoseconds by) {
   runUntilIdle();
   const std::chrono::nanoseconds until = now_ + by;
-  while (runNextDelayed(until)) runUntilIdle();
+  while (passNext(until)) runUntilIdle();
   moveTimeTo(until);
 }
 
-bool FakeDispatchService::runNextDelayed(std::chrono::nanoseconds until) {
+// Goes on to the next delayed job or end of a wait; false when there is none up to that time.
+bool FakeDispatchService::passNext(std::chrono::nanoseconds until) {
   std::chrono::nanoseconds time{};
   Job job;
+  std::optional<Wait> wait;
   {
     const std::lock_guard lock(mutex_);
-    const auto next = delayed_.begin();
-    if (next == delayed_.end() || next->first > until) return false;
-    time = next->first;
-    job = std::move(next->second);
-    delayed_.erase(next);
+    const auto delayed = delayed_.begin();
+    const auto timingOut = firstToTimeOut();
+    const bool isWait = timingOut != waits_.end() &&
+                        (delayed == delayed_.end() || *timingOut->end < delayed->first);
+    if (!isWait && delayed == delayed_.end()) return false;
+    time = isWait ? *timingOut->end : delayed->first;
+    if (time > until) return false;
+    if (isWait) {
+      wait = std::move(*timingOut);
+      waits_.erase(timingOut);
+    } else {
+      job = std::move(delayed->second);
+      delayed_.erase(delayed);
+    }
   }
   moveTimeTo(time);
+  if (!wait.has_value()) {
+    runDelayed(std::move(job));
+    return true;
+  }
+  const std::lock_guard lock(mutex_);
+  endWait(std::move(*wait), WaitOutcome::kTimedOut);
+  return true;
+}
+
+FakeDispatchService::Waits::iterator FakeDispatchService::firstToTimeOut() {
+  auto first = waits_.end();
+  for (auto wait = waits_.begin(); wait != waits_.end(); ++wait) {
+    if (!wait->end.has_value()) continue;
+    if (first == waits_.end() || *wait->end < *first->end) first = wait;
+  }
+  return first;
+}
+
+void FakeDispatchService::runDelayed(Job job) {
   const RunningMark mark(nullptr);
   job();
-  job = nullptr;
-  return true;
+  job = nullptr;  // what the job held goes while it still counts as running
 }
 
 void FakeDispatchService::moveTimeTo(std::chrono::nanoseconds time) {
@@ -93,9 +139,12 @@ void FakeDispatchService::moveTimeTo(std::chrono::nanoseconds time) {
 void FakeDispatchService::clear() {
   while (true) {
     std::deque<Waiting> waiting;
+    Waits waits;
     std::multimap<std::chrono::nanoseconds, Job> delayed;
     const std::lock_guard lock(mutex_);
-    if (waiting_.empty() && delayed_.empty()) return;
+    if (waiting_.empty() && waits_.empty() && delayed_.empty()) return;
+    for (const Wait& wait : waits_) wait.queue->isWaiting_ = false;
+    waits.swap(waits_);
     waiting.swap(waiting_);
     delayed.swap(delayed_);
   }
@@ -109,6 +158,11 @@ std::size_t FakeDispatchService::waitingJobs() const {
 std::size_t FakeDispatchService::delayedJobs() const {
   const std::lock_guard lock(mutex_);
   return delayed_.size();
+}
+
+std::size_t FakeDispatchService::waitingQueues() const {
+  const std::lock_guard lock(mutex_);
+  return waits_.size();
 }
 
 std::vector<std::chrono::nanoseconds> FakeDispatchService::delays() const {
@@ -139,16 +193,55 @@ std::shared_ptr<DispatchQueue> FakeDispatchService::createSerialQueue(std::strin
   return std::make_shared<FakeDispatchQueue>(*this, created_.back());
 }
 
+std::shared_ptr<DispatchSemaphore> FakeDispatchService::createSemaphore(std::uint64_t signals) {
+  return std::make_shared<FakeDispatchSemaphore>(*this, signals);
+}
+
 void FakeDispatchService::asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) {
   const std::lock_guard lock(mutex_);
   delayed_.emplace(now_ + delay, std::move(job));
 }
 
-void FakeDispatchService::add(std::shared_ptr<const FakeDispatchQueue> queue, JobWeight weight,
-                              Job job) {
+void FakeDispatchService::add(std::shared_ptr<FakeDispatchQueue> queue, JobWeight weight, Job job) {
   const std::lock_guard lock(mutex_);
   weights_.emplace(queue->traits().label, weight);
   waiting_.push_back({std::move(queue), std::move(job)});
+}
+
+void FakeDispatchService::beginWait(Wait wait) {
+  const std::lock_guard lock(mutex_);
+  if (wait.queue->isWaiting_) throw std::logic_error("a job began a second wait");
+  wait.queue->isWaiting_ = true;
+  if (wait.semaphore->signals_ > 0) {
+    --wait.semaphore->signals_;
+    return endWait(std::move(wait), WaitOutcome::kSignalled);
+  }
+  if (wait.end.has_value()) {
+    if (wait.end->count() <= 0) return endWait(std::move(wait), WaitOutcome::kTimedOut);
+    *wait.end = now_ + std::min(*wait.end, std::chrono::nanoseconds::max() - now_);
+  }
+  waits_.push_back(std::move(wait));
+}
+
+void FakeDispatchService::signal(FakeDispatchSemaphore& semaphore) {
+  const std::lock_guard lock(mutex_);
+  const auto first = std::ranges::find_if(
+      waits_, [&](const Wait& wait) { return wait.semaphore.get() == &semaphore; });
+  if (first == waits_.end()) {
+    ++semaphore.signals_;
+    return;
+  }
+  Wait wait = std::move(*first);
+  waits_.erase(first);
+  endWait(std::move(wait), WaitOutcome::kSignalled);
+}
+
+void FakeDispatchService::endWait(Wait wait, WaitOutcome outcome) {
+  wait.queue->isWaiting_ = false;
+  const auto place = std::ranges::find_if(
+      waiting_, [&](const Waiting& waiting) { return waiting.queue == wait.queue; });
+  Job job = [then = std::move(wait.then), outcome] { then(outcome); };
+  waiting_.insert(place, {std::move(wait.queue), std::move(job)});
 }
 
 }  // namespace halvox::platform

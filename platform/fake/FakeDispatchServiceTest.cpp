@@ -1,6 +1,7 @@
 #include "platform/fake/FakeDispatchService.h"
 
 #include <memory>
+#include <optional>
 #include <stdexcept>
 #include <string>
 #include <thread>
@@ -201,6 +202,107 @@ TEST_F(FakeDispatchServiceTest, AnyThreadMayAddJobs) {
   dispatch_.runUntilIdle();
 
   EXPECT_EQ(ran, 400);
+}
+
+class FakeDispatchWaitTest : public FakeDispatchServiceTest {
+ protected:
+  // A job that waits on the semaphore and notes how that ended.
+  Job waitOn(const std::shared_ptr<DispatchQueue>& queue,
+             std::optional<std::chrono::nanoseconds> timeout) {
+    return [this, &queue, timeout] {
+      queue->waitOn(semaphore_, timeout, [this](WaitOutcome outcome) {
+        steps_.emplace_back(outcome == WaitOutcome::kSignalled ? "signalled" : "timed out");
+      });
+    };
+  }
+
+  std::shared_ptr<DispatchSemaphore> semaphore_ = dispatch_.createSemaphore(0);
+};
+
+TEST_F(FakeDispatchWaitTest, WaitingQueueKeepsItsJobsWhileOthersGoOn) {
+  const auto queue = makeQueue("queue");
+  const auto other = makeQueue("other");
+  queue->async(JobWeight::kBrief, waitOn(queue, std::nullopt));
+  queue->async(JobWeight::kBrief, step("after"));
+  other->async(JobWeight::kBrief, step("other"));
+
+  dispatch_.runUntilIdle();
+  EXPECT_EQ(steps_, Steps{"other"});
+  EXPECT_EQ(dispatch_.waitingJobs(), 1U);
+  EXPECT_EQ(dispatch_.waitingQueues(), 1U);
+  std::jthread([this] { semaphore_->signal(); }).join();
+  dispatch_.runUntilIdle();
+
+  EXPECT_EQ(steps_, (Steps{"other", "signalled", "after"}));
+}
+
+TEST_F(FakeDispatchWaitTest, WaitEndsAtItsTimeAndTheClockShowsIt) {
+  const auto queue = makeQueue("queue");
+  const auto begin = clock_.processUptime();
+  queue->async(JobWeight::kBrief, waitOn(queue, 5s));
+  queue->async(JobWeight::kBrief,
+               [&] { steps_.push_back(std::to_string((clock_.processUptime() - begin).count())); });
+
+  dispatch_.advance(4999ms);
+  EXPECT_TRUE(steps_.empty());
+  dispatch_.advance(2s);
+
+  EXPECT_EQ(steps_, (Steps{"timed out", "5000"}));
+  EXPECT_EQ(dispatch_.waitingQueues(), 0U);
+}
+
+TEST_F(FakeDispatchWaitTest, SignalAtTheTimeOfTheTimeOutEndsTheWait) {
+  const auto queue = makeQueue("queue");
+  queue->async(JobWeight::kBrief, waitOn(queue, 1s));
+  dispatch_.runUntilIdle();
+  dispatch_.asyncAfterOnBackgroundQueue(1s, [this] { semaphore_->signal(); });
+
+  dispatch_.advance(1s);
+
+  EXPECT_EQ(steps_, Steps{"signalled"});
+}
+
+TEST_F(FakeDispatchWaitTest, EndlessTimeOutIsLater) {
+  const auto queue = makeQueue("queue");
+  dispatch_.advance(1s);
+  queue->async(JobWeight::kBrief, waitOn(queue, std::chrono::nanoseconds::max()));
+
+  dispatch_.advance(std::chrono::hours(24));
+
+  EXPECT_TRUE(steps_.empty());
+  EXPECT_EQ(dispatch_.waitingQueues(), 1U);
+}
+
+TEST_F(FakeDispatchWaitTest, ClearingDropsWaits) {
+  auto queue = makeQueue("queue");
+  const std::weak_ptr<DispatchQueue> weakQueue = queue;
+  queue->async(JobWeight::kBrief, waitOn(queue, 1s));
+  dispatch_.runUntilIdle();
+
+  dispatch_.clear();
+  dispatch_.advance(2s);
+  EXPECT_TRUE(steps_.empty());
+  EXPECT_EQ(dispatch_.waitingQueues(), 0U);
+  queue->async(JobWeight::kBrief, step("later"));
+  dispatch_.runUntilIdle();
+  queue.reset();
+
+  EXPECT_EQ(steps_, Steps{"later"});
+  EXPECT_TRUE(weakQueue.expired());
+}
+
+TEST_F(FakeDispatchWaitTest, RefusesWaitsThatNoQueueDoes) {
+  const auto queue = makeQueue("queue");
+  const auto own = dispatch_.createSerialQueue("own", QualityOfService::kUserInteractive,
+                                               QueueThreading::kOwnThread);
+  EXPECT_THROW(waitOn(queue, 1s)(), std::logic_error);
+  own->async(JobWeight::kBrief, waitOn(own, 1s));
+  EXPECT_THROW(dispatch_.runUntilIdle(), std::logic_error);
+  queue->async(JobWeight::kBrief, [&] {
+    waitOn(queue, 1s)();
+    waitOn(queue, 1s)();
+  });
+  EXPECT_THROW(dispatch_.runUntilIdle(), std::logic_error);
 }
 
 }  // namespace
