@@ -5,10 +5,15 @@
 #include "platform/fake/FakeClockService.h"
 #include "platform/fake/FakeConnectionService.h"
 #include "platform/fake/FakeDevicePropertyService.h"
+#include "platform/fake/FakeDiagnosticReporterService.h"
 #include "platform/fake/FakeDispatchService.h"
 #include "platform/fake/FakeFeatureFlagService.h"
 #include "platform/fake/FakeKdebugService.h"
 #include "platform/fake/FakeLogService.h"
+#include "platform/fake/FakeMetricService.h"
+#include "platform/fake/FakePowerLogService.h"
+#include "platform/fake/FakeNotifyService.h"
+#include "platform/fake/FakePreferenceService.h"
 #include "platform/fake/FakeProcessService.h"
 #include "platform/fake/FakeStatisticsService.h"
 #include "platform/fake/Journal.h"
@@ -38,12 +43,12 @@ struct FakePlatform {
   FakeDevicePropertyService deviceProperties;
   FakeFeatureFlagService featureFlags;
   FakeAnalyticsService analytics{journal};
-  AbsentDiagnosticReporters diagnosticReporters;
+  FakeDiagnosticReporterService diagnosticReporters{journal};
   AbsentFiles files;
-  AbsentMetrics metrics;
-  AbsentNotify notify;
-  AbsentPowerLog powerLog;
-  AbsentPreferences preferences;
+  FakeMetricService metrics{journal};
+  FakeNotifyService notify;
+  FakePowerLogService powerLog{journal};
+  FakePreferenceService preferences;
   AbsentTlmReporting tlmReporting;
   FakeDispatchService dispatch{clock};
   FakeConnectionService connections{journal};

@@ -9,13 +9,16 @@ namespace halvox::platform {
 
 // What a journal entry tells of.
 enum class JournalKind : unsigned char {
-  kLogLine,         // text: the line without its prefix
-  kTracePoint,      // text: the code as "0x21044828"
-  kAnalyticsTest,   // text: the name that was asked for
-  kAnalyticsEvent,  // text: the name that was sent
-  kReply,           // text: the name of the method that was answered
-  kTermination,     // text: the exit status
-  kNote,            // text: whatever the test wrote
+  kLogLine,          // text: the line without its prefix
+  kTracePoint,       // text: the code as "0x21044828"
+  kAnalyticsTest,    // text: the name that was asked for
+  kAnalyticsEvent,   // text: the name that was sent
+  kMetric,           // text: the metric's identifier in decimal digits
+  kPowerEvent,       // text: the event's name
+  kSnapshotRequest,  // text: the signature's description
+  kReply,            // text: the name of the method that was answered
+  kTermination,      // text: the exit status
+  kNote,             // text: whatever the test wrote
 };
 
 struct JournalEntry {
