@@ -1,0 +1,43 @@
+#pragma once
+
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/notify.h"
+
+namespace halvox::platform {
+
+// Notifications that the test posts. Tokens count from 1. Any thread may call.
+class FakeNotifyService final : public NotifyService {
+ public:
+  // From now on registrations of that name fail with that status.
+  void failRegistration(std::string_view name, NotifyStatus status);
+  // Queues the handlers that are registered for that name, in the order of their registration.
+  void post(std::string_view name);
+  // Forgets all registrations and with them what their handlers hold.
+  void clear();
+  // The names that were registered with success, in order.
+  [[nodiscard]] std::vector<std::string> registeredNames() const;
+
+  NotifyStatus notify_register_dispatch(std::string_view name, NotifyToken& token,
+                                        std::shared_ptr<DispatchQueue> queue,
+                                        Handler handler) override;
+
+ private:
+  struct Registration {
+    std::string name;
+    NotifyToken token;
+    std::shared_ptr<DispatchQueue> queue;
+    Handler handler;
+  };
+
+  mutable std::mutex mutex_;
+  std::map<std::string, NotifyStatus, std::less<>> failures_;
+  std::vector<Registration> registrations_;
+};
+
+}  // namespace halvox::platform
