@@ -116,7 +116,7 @@ class HVReportingClientServerInstance final
   void end(const Session& session, const Delegate& delegate);
   void sendToNamedSessions(const MessageRequest& request) const;
   void sendToActiveSessions(const MessageRequest& request, const Delegate& delegate) const;
-  void sendStandalone(const MessageRequest& request) const;
+  void sendStandalone(const MessageRequest& request, const Delegate& delegate) const;
 
   // Changes of the map and of what is in it go through these, which tell the delegate and the
   // account.

@@ -1,12 +1,9 @@
-#include <algorithm>
-#include <cmath>
-#include <limits>
-
 #include "backends/HVReportingTallyhubBridge.h"
 #include "platform/clock.h"
 #include "platform/services.h"
 #include "platform/statistics.h"
 #include "service/HVReportingClientServerInstance.h"
+#include "service/RoundedSeconds.h"
 #include "service/ServiceLog.h"
 #include "session/SessionLog.h"
 #include "session/TracePoints.h"
@@ -55,13 +52,6 @@ class ReporterIDsDescription {
  private:
   const HVReportingServiceProtocol::ReporterIDs& reporters_;  // owned by the request
 };
-
-// Halves go away from zero.
-std::int32_t roundedSeconds(std::chrono::duration<double> time) {
-  using Limits = std::numeric_limits<std::int32_t>;
-  return static_cast<std::int32_t>(
-      std::clamp<double>(std::round(time.count()), Limits::min(), Limits::max()));
-}
 
 // Marks the message with the time of its arrival. Whatever the client sent under these keys goes
 // first, so that the stamps come last and also win over keys that become theirs when blanks are
@@ -122,7 +112,7 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
                      sessionsDescription(sessions));
   counters().delivered.add();
   if (sessions.empty()) {
-    sendStandalone(request);
+    sendStandalone(request, delegate);
     return;
   }
   // Here the session comes before the back-ends, and for named sessions after them. Both orders are
@@ -134,7 +124,8 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
   }
 }
 
-void HVReportingClientServerInstance::sendStandalone(const MessageRequest& request) const {
+void HVReportingClientServerInstance::sendStandalone(const MessageRequest& request,
+                                                     const Delegate& delegate) const {
   const auto session = std::make_shared<HVReportingSession>(
       kStandaloneReporterID,
       HVReportingSession::ProcessIdentifiers{platform::process().ownProcessIdentifier()});
@@ -144,7 +135,8 @@ void HVReportingClientServerInstance::sendStandalone(const MessageRequest& reque
   HVReportingTallyhubBridge::handleEvent(request.message, request.category, request.type, session);
   kServiceLog.notice("no active reporting sessions found, sending as standalone");
   HVReportingSession::sendSingleMessage(request.message, request.category, request.type,
-                                        AudioServiceType::kStandalone, {}, nullptr);
+                                        AudioServiceType::kStandalone, delegate->getDefaults(),
+                                        nullptr);
 }
 
 }  // namespace halvox

@@ -57,6 +57,14 @@ void deliverHeldReply(HVReportingSession& session) {
   held(std::nullopt, true);
 }
 
+// What is watched may have a state or none; here only a state is worth a message.
+void sendFeaturesState(HVReportingSession& session, const Delegate& delegate) {
+  if (delegate == nullptr) return;
+  const platform::Message state = delegate->getFeaturesState();
+  if (!state.has_value()) return;
+  session.sendMessage(state, AudioEventCategory::kSetup, AudioEventType::kSetup, nullptr);
+}
+
 bool isTracingTest(const HVReportingSession& session) {
   return platform::featureFlags()._os_feature_enabled_impl("Acoustat", "Tracing") &&
          session.serviceType() == AudioServiceType::kTest;
@@ -135,6 +143,7 @@ void HVReportingClientServerInstance::begin(const Session& session, const Delega
   deliverHeldReply(*session);
   startReplies().heldBack.add();
   session->setTransactionCompleteBlock(reply);
+  sendFeaturesState(*session, delegate);
   // The reply stays stored all the same, and is called again when the session is stopped.
   if (isTracingTest(*session)) reply(std::nullopt, true);
   logActiveSessions(delegate);

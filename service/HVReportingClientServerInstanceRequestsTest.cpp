@@ -266,13 +266,13 @@ TEST_F(HVReportingClientServerInstanceRequestsTest, StartStepsInOrder) {
 
   start(client_, 7);
 
-  EXPECT_THAT(
-      steps(),
-      ElementsAre("starting session for reporter 7", "0x21044818", "starting session owned by 7",
-                  "0x2104482C", std::string("sessions for client 100 : (") + kSessionSeven + ")",
-                  "sessions for client 101 : ()",
-                  std::string("1 active reporting session(s) (") + kSessionSeven + ")"));
-  EXPECT_EQ(lines(LogLevel::kDefault).size(), 3U);
+  EXPECT_THAT(steps(),
+              ElementsAre("starting session for reporter 7", "0x21044818",
+                          "starting session owned by 7", "0x2104482C", "getting features",
+                          std::string("sessions for client 100 : (") + kSessionSeven + ")",
+                          "sessions for client 101 : ()",
+                          std::string("1 active reporting session(s) (") + kSessionSeven + ")"));
+  EXPECT_EQ(lines(LogLevel::kDefault).size(), 4U);
   EXPECT_EQ(lines(LogLevel::kDebug).size(), 2U);
 }
 
@@ -365,8 +365,8 @@ TEST_F(HVReportingClientServerInstanceRequestsTest, ATracingTestRepliesAtOnceAnd
 
   const Call started = start(client_, 7);
   EXPECT_THAT(started->replies(), ElementsAre(ok(true)));
-  ASSERT_GE(steps().size(), 5U);
-  EXPECT_EQ(steps()[4], "startReportingSessionForID");  // before the list of active sessions
+  ASSERT_GE(steps().size(), 6U);
+  EXPECT_EQ(steps()[5], "startReportingSessionForID");  // before the list of active sessions
 
   stop(client_, 7);
   EXPECT_THAT(started->replies(), ElementsAre(ok(true), ok(true)));

@@ -83,7 +83,10 @@ std::vector<std::shared_ptr<HVReportingSession>> sessionsOf(
 
 }  // namespace
 
-HVReportingServiceDelegate::HVReportingServiceDelegate() { createReportingQueue(); }
+HVReportingServiceDelegate::HVReportingServiceDelegate()
+    : defaults_((createReportingQueue(), HVReportingDefaults())), features_(makeFeatures()) {
+  listenForFeatureStateChanges();
+}
 
 bool HVReportingServiceDelegate::listenerShouldAcceptNewConnection(
     const std::shared_ptr<platform::NSXPCConnection>& connection) {

@@ -4,16 +4,24 @@
 #include <cstdint>
 #include <memory>
 #include <mutex>
+#include <string_view>
+#include <vector>
 
 #include "platform/connection.h"
+#include "platform/notify.h"
 #include "platform/process.h"
+#include "platform/value.h"
 #include "service/HVReportingServiceDelegateProtocol.h"
 #include "service/SessionIndex.h"
 
 namespace halvox {
 
+// The notification by which somebody announces that the service's own settings have changed.
+inline constexpr std::string_view gReportingNotifydNotificationName = "com.tarno.halvox.reporting";
+
 // The centre of the service: accepts every connection, keeps the list of clients, and answers what
-// client objects ask of the whole. One a process; making it makes the reporting queue.
+// client objects ask of the whole. One a process; making it makes the reporting queue,
+// reads the defaults and registers for changes of the watched settings.
 //
 // Connections come on their own threads, everything about clients runs on the reporting queue. Held
 // by whoever made it, always by a shared pointer, for the life of the process; clients refer to it
@@ -23,6 +31,9 @@ class HVReportingServiceDelegate final
       public HVReportingServiceDelegateProtocol,
       public std::enable_shared_from_this<HVReportingServiceDelegate> {
  public:
+  // One dictionary a watched setting: where it is, and which notification tells of its changes.
+  using Features = std::vector<platform::Dictionary>;
+
   HVReportingServiceDelegate();
   HVReportingServiceDelegate(const HVReportingServiceDelegate&) = delete;
   HVReportingServiceDelegate& operator=(const HVReportingServiceDelegate&) = delete;
@@ -36,6 +47,11 @@ class HVReportingServiceDelegate final
   // The master switch. On from the beginning; nothing in the service turns it off.
   void setReportingEnabled(bool enabled);
 
+  // The descriptors of the watched settings.
+  [[nodiscard]] const Features& features() const { return features_; }
+
+  [[nodiscard]] const platform::Dictionary& getDefaults() const override { return defaults_; }
+  [[nodiscard]] platform::Message getFeaturesState() const override;
   [[nodiscard]] const Clients& getAllClients() const override { return clients_; }
   [[nodiscard]] bool isReportingEnabled() const override;
   [[nodiscard]] Sessions getAllActiveReportingSessions() const override;
@@ -54,6 +70,14 @@ class HVReportingServiceDelegate final
   Client exportClient(platform::NSXPCConnection& connection);
   void registerClient(const Client& client);
 
+  // The settings that are read once, at the start. Reads files.
+  static platform::Dictionary HVReportingDefaults();
+  static Features makeFeatures();
+  // Registers for each feature and notes its token. A registration that fails is logged only.
+  void listenForFeatureStateChanges();
+  // Sends the state of the features to every session of every client. On the reporting queue.
+  void handleFeatureChange(platform::NotifyToken token);
+
   // Taken while a connection is prepared and while a session is looked up across clients.
   mutable std::recursive_mutex lock_;
   Clients clients_;     // reporting queue only
@@ -61,6 +85,10 @@ class HVReportingServiceDelegate final
   // Single values that order with nothing.
   std::atomic<bool> reportingEnabled_{true};
   std::atomic<std::int64_t> activeSessionCount_{0};
+  const platform::Dictionary defaults_;
+  Features features_;  // never changes once made
+  // Ends with this object; those whom it gave handlers that refer to it look here first.
+  const std::shared_ptr<const bool> alive_ = std::make_shared<bool>(true);
 };
 
 }  // namespace halvox

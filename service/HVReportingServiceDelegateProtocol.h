@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "backends/HVReportingVocabulary.h"
+#include "platform/value.h"
 
 namespace halvox {
 
@@ -23,6 +24,11 @@ class HVReportingServiceDelegateProtocol {
 
   virtual ~HVReportingServiceDelegateProtocol() = default;
 
+  // The settings as they were at the start. Any thread.
+  [[nodiscard]] virtual const platform::Dictionary& getDefaults() const = 0;
+  // The watched settings as they are now with the time of reading, or none when none of them is
+  // set. Reads files.
+  [[nodiscard]] virtual platform::Message getFeaturesState() const = 0;
   // The connected clients in the order of their registration: the list itself, not a copy.
   [[nodiscard]] virtual const Clients& getAllClients() const = 0;
   // Whether reporting is switched on. Any thread.

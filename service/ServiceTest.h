@@ -21,7 +21,10 @@ class ServiceTest : public testing::Test {
   using Connection = std::shared_ptr<platform::FakeConnection>;
   using Call = std::shared_ptr<platform::FakeCall>;
 
-  ServiceTest() { platform_.connections.serviceListener().setDelegate(*delegate_); }
+  ServiceTest() {
+    platform_.connections.serviceListener().setDelegate(*delegate_);
+    forgetSteps();  // those of making the delegate
+  }
 
   // A client of a new process; registered unless told otherwise.
   Connection connectUnregistered(platform::ProcessID pid, const std::string& name = "player") {

@@ -1,0 +1,124 @@
+#include <string>
+#include <utility>
+
+#include "platform/clock.h"
+#include "platform/notify.h"
+#include "platform/preferences.h"
+#include "platform/services.h"
+#include "service/HVReportingClientServerInstance.h"
+#include "service/HVReportingServiceDelegate.h"
+#include "service/NSUserDefaults.h"
+#include "service/ReportingQueue.h"
+#include "service/RoundedSeconds.h"
+#include "service/ServiceLog.h"
+
+// The settings that tune the service from the outside: the defaults, which are read once, and the
+// watched features, which are read whenever somebody wants to know.
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+
+constexpr std::string_view kOwnDomain = "com.tarno.halvox";
+// The settings of this user are the ones that count.
+constexpr std::string_view kUserName = "mobile";
+
+// What a feature descriptor says.
+constexpr std::string_view kDefaultsDomainKey = "defaults_domain";
+constexpr std::string_view kFeatureDomainKey = "feature_domain";
+constexpr std::string_view kNotificationKey = "notification";
+constexpr std::string_view kNotifyTokenKey = "notify_token";
+// Settings.
+constexpr std::string_view kDeviceNameKey = "device_name";
+constexpr std::string_view kDisableReportingKey = "disable_reporting";
+
+constexpr platform::NotifyToken kNoToken = 0;
+
+// A text of a descriptor, empty when it has none.
+std::string_view text(const Dictionary& descriptor, std::string_view key) {
+  const platform::Value* value = descriptor.find(key);
+  return value == nullptr ? std::string_view() : value->string();
+}
+
+void stamp(Dictionary& state) {
+  const platform::ClockService& clock = platform::clock();
+  state.set("hvreporting_timestamp", clock.currentDate().secondsSince1970);
+  state.set("systemuptime_sec", roundedSeconds(clock.systemUptime()));
+}
+
+}  // namespace
+
+Dictionary HVReportingServiceDelegate::HVReportingDefaults() {
+  const NSUserDefaults store(kOwnDomain);
+  Dictionary defaults;
+  if (store.objectForKey(kDeviceNameKey).has_value()) {
+    // A value that has no text leaves the key out, like none.
+    if (auto name = store.stringForKey(kDeviceNameKey)) defaults.set(kDeviceNameKey, *name);
+  }
+  if (store.objectForKey(kDisableReportingKey).has_value()) {
+    defaults.set(kDisableReportingKey, store.boolForKey(kDisableReportingKey));
+  } else {
+    defaults.set(kDisableReportingKey, 0);
+  }
+  return defaults;
+}
+
+HVReportingServiceDelegate::Features HVReportingServiceDelegate::makeFeatures() {
+  return {{{kDefaultsDomainKey, "com.tarno.pavisk"},
+           {kFeatureDomainKey, "spatial-audio-accessory-feature"},
+           {kNotificationKey, "com.tarno.pavisk.spatial-audio-accessory-feature.changed"}},
+          {{kDefaultsDomainKey, kOwnDomain},
+           {kFeatureDomainKey, kDeviceNameKey},
+           {kNotificationKey, gReportingNotifydNotificationName}}};
+}
+
+platform::Message HVReportingServiceDelegate::getFeaturesState() const {
+  kServiceLog.notice("getting features");
+  Dictionary state;
+  for (const Dictionary& descriptor : features_) {
+    const std::string_view domain = text(descriptor, kDefaultsDomainKey);
+    const std::string_view feature = text(descriptor, kFeatureDomainKey);
+    if (domain.empty() || feature.empty()) continue;
+    auto value = platform::preferences().CFPreferencesCopyValue(feature, domain, kUserName);
+    if (value.has_value()) state.set(feature, *std::move(value));
+  }
+  if (state.empty()) return std::nullopt;
+  stamp(state);
+  return state;
+}
+
+void HVReportingServiceDelegate::listenForFeatureStateChanges() {
+  kServiceLog.info("listening for features ",
+                   ListDescription(features_, [](std::string& line, const Dictionary& descriptor) {
+                     line += platform::describe(descriptor);
+                   }));
+  for (Dictionary& descriptor : features_) {
+    const std::string_view notification = text(descriptor, kNotificationKey);
+    if (text(descriptor, kDefaultsDomainKey).empty() || notification.empty()) continue;
+    platform::NotifyToken token = kNoToken;
+    // Runs on the reporting queue for the life of the process, as this object lives; the token of
+    // life is for those who make a delegate and drop it.
+    const platform::NotifyStatus status = platform::notify().notify_register_dispatch(
+        notification, token, reportingQueue(),
+        [this, alive = std::weak_ptr<const bool>(alive_)](platform::NotifyToken fired) {
+          if (!alive.expired()) handleFeatureChange(fired);
+        });
+    descriptor.set(kNotifyTokenKey, token);
+    kServiceLog.notice("notify setup result ", status, " token ", token);
+  }
+}
+
+// A session start sends only a state that there is. Here it is sent even when there is none, so
+// that sessions hear of the removal of the last setting. Both are intended.
+void HVReportingServiceDelegate::handleFeatureChange(platform::NotifyToken token) {
+  kServiceLog.info("feature ", token, " changes");
+  const platform::Message state = getFeaturesState();
+  kServiceLog.info("defaults ", state);
+  for (const Client& client : clients_) {
+    for (const auto& [reporterID, session] : client->clientReportingSessionMap()) {
+      session->sendMessage(state, AudioEventCategory::kSetup, AudioEventType::kSetup, nullptr);
+    }
+  }
+}
+
+}  // namespace halvox
