@@ -1,0 +1,24 @@
+#include "driver/HVReportingDriver.h"
+
+#include <utility>
+
+namespace halvox {
+namespace {
+
+std::optional<std::string> copy(std::optional<std::string_view> name) {
+  if (!name.has_value()) return std::nullopt;
+  return std::string(*name);
+}
+
+}  // namespace
+
+HVReportingDriver HVReportingDriver::driverWithGroupName(
+    std::optional<std::string_view> groupName, std::optional<std::string_view> subGroupName) {
+  return {copy(groupName), copy(subGroupName)};
+}
+
+std::string HVReportingDriver::description() const {
+  return groupName_.value_or("(null)") + "-" + subGroupName_.value_or("(null)");
+}
+
+}  // namespace halvox

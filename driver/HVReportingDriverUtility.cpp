@@ -1,0 +1,268 @@
+#include "driver/HVReportingDriverUtility.h"
+
+#include <algorithm>
+#include <array>
+#include <cstdio>
+#include <optional>
+#include <utility>
+
+#include "backends/HVReportingTallyhubBridge.h"
+#include "backends/HVReportingVocabulary.h"
+#include "driver/DriverLog.h"
+#include "platform/services.h"
+#include "session/HVReportingSession.h"
+
+namespace halvox {
+namespace {
+
+using platform::IOReportChannel;
+using platform::IOReportError;
+using platform::IOReportFormat;
+using platform::IOReportService;
+using Name = std::optional<std::string_view>;
+
+struct DriverNames {
+  Name group;
+  Name subGroup;
+};
+
+// The channel groups that are reported, in the order of their reports.
+constexpr std::array kDrivers{
+    DriverNames{"TarnoQ7AMP", std::nullopt},
+    DriverNames{"Speaker", std::nullopt},
+    DriverNames{std::nullopt, "MCA"},
+    DriverNames{"Haptics", "Stats"},
+    DriverNames{"StateTransitionTimes_ms", std::nullopt},
+    DriverNames{"Rx", std::nullopt},
+    DriverNames{"Tx", std::nullopt},
+    DriverNames{std::nullopt, "IOSndFam2"},
+};
+
+constexpr std::string_view kSimpleType = "Simple";
+constexpr std::string_view kHistogramType = "Histogram";
+constexpr std::string_view kStateType = "State";
+
+std::string_view shown(Name name) { return name.value_or("(null)"); }
+
+void logSampleError(const std::optional<IOReportError>& error) {
+  if (error.has_value()) kDriverLog.error("IOReportCreateSamples error ", error->code);
+}
+
+IOReportService::Samples createSamples(const HVReportingIOChannelSubscription& subscription) {
+  std::optional<IOReportError> error;
+  auto samples = platform::ioReport().IOReportCreateSamples(
+      subscription.subscription(), subscription.subscribedChannels(), error);
+  if (samples == nullptr) logSampleError(error);
+  return samples;
+}
+
+// The change since the snapshot, or null. A delta that fails is reported with the text of a sample
+// that fails; that is kept.
+IOReportService::Samples createDelta(const DriverSnapShot& snapShot, const std::string& description,
+                                     const IOReportService::Samples& current) {
+  const auto found = snapShot.find(description);
+  const IOReportService::Samples previous = found == snapShot.end() ? nullptr : found->second;
+  std::optional<IOReportError> error;
+  auto delta = platform::ioReport().IOReportCreateSamplesDelta(previous, current, error);
+  if (delta == nullptr) logSampleError(error);
+  return delta;
+}
+
+void send(const HVReportingDriverUtility::DriverStats& stats, AudioEventType type,
+          const std::shared_ptr<HVReportingSession>& session) {
+  if (stats.empty()) return;
+  session->sendMessage(stats, AudioEventCategory::kIOReporting, type, nullptr);
+  HVReportingTallyhubBridge::handleEvent(stats, AudioEventCategory::kIOReporting, type, session);
+}
+
+void appendCleaned(std::string& text, std::string_view part) {
+  std::ranges::copy_if(part, std::back_inserter(text),
+                       [](char letter) { return letter != '_' && letter != ' '; });
+}
+
+void appendKeyPart(std::string& key, Name part) {
+  if (!part.has_value()) return;
+  appendCleaned(key, *part);
+  key += '_';
+}
+
+struct HistogramText {
+  std::int64_t lower = 0;
+  std::int64_t upper = 0;
+  std::string buckets;
+};
+
+// The lowest bound never rises above 0 and the highest never falls below it. A bucket whose bounds
+// cannot be read is not skipped: it counts with those of the bucket before it.
+HistogramText describeBuckets(const IOReportChannel& channel, std::int32_t count) {
+  HistogramText text;
+  std::int64_t lower = 0;
+  std::int64_t upper = 0;
+  for (std::int32_t index = 0; index < count; ++index) {
+    const auto result = IOReportHistogramGetBucketBounds(channel, index, lower, upper);
+    if (result != 0) kDriverLog.info("Error in getting the bucket bounds : ", result);
+    text.lower = std::min(text.lower, lower);
+    text.upper = std::max(text.upper, upper);
+    const std::uint64_t hits = IOReportHistogramGetBucketHits(channel, index);
+    if (hits == 0) continue;
+    // Written as a signed number.
+    text.buckets += std::to_string(lower) + "-" + std::to_string(upper) + ":" +
+                    std::to_string(static_cast<std::int64_t>(hits)) + ";";
+  }
+  return text;
+}
+
+}  // namespace
+
+HVReportingDriverUtility::HVReportingDriverUtility() {
+  kDriverLog.info("creating ioreporting driver utility");
+  for (const DriverNames& names : kDrivers) {
+    subscribe(HVReportingDriver::driverWithGroupName(names.group, names.subGroup));
+  }
+}
+
+void HVReportingDriverUtility::subscribe(const HVReportingDriver& driver) {
+  const Name group = driver.groupName();
+  const Name subGroup = driver.subGroupName();
+  IOReportService& reports = platform::ioReport();
+  std::optional<IOReportError> error;
+  const auto channels = reports.IOReportCopyChannelsInGroup(group, subGroup, error);
+  // Said even when channels came with it.
+  if (error.has_value()) {
+    kDriverLog.error("error ", error->code, " getting channels for driver ", shown(group), "-",
+                     shown(subGroup));
+  }
+  if (channels == nullptr) return;
+  if (reports.IOReportGetChannelCount(channels) < 1) {
+    kDriverLog.info("couldn't find any channels for driver group ", shown(group), "-",
+                    shown(subGroup));
+    return;
+  }
+  HVReportingIOChannelSubscription subscription(driver);
+  IOReportService::Channels subscribed;
+  error.reset();
+  subscription.setSubscription(reports.IOReportCreateSubscription(channels, subscribed, error));
+  if (subscribed != nullptr) {
+    subscription.setSubscribedChannels(std::move(subscribed));
+    ioChannelSubscriptions_.push_back(std::move(subscription));
+    kDriverLog.info("subscribed to group group ", shown(group), "-", shown(subGroup));
+  } else if (error.has_value()) {
+    kDriverLog.error("error ", error->code, " creating subscription for ", shown(group), "-",
+                     shown(subGroup));
+  }
+}
+
+DriverSnapShot HVReportingDriverUtility::getSnapShot() const {
+  DriverSnapShot snapShot;
+  for (const auto& subscription : ioChannelSubscriptions_) {
+    std::string description = subscription.driver().description();
+    kDriverLog.info("sampling driver ", description);
+    if (auto samples = createSamples(subscription)) {
+      snapShot.insert_or_assign(std::move(description), std::move(samples));
+    }
+  }
+  return snapShot;
+}
+
+void HVReportingDriverUtility::sendDriverLogsForSession(
+    const std::shared_ptr<HVReportingSession>& session) const {
+  Stats stats;
+  const auto snapShot = session->driverSnapShot();
+  for (const auto& subscription : ioChannelSubscriptions_) {
+    kDriverLog.info("getting latest samples");
+    const auto current = createSamples(subscription);
+    kDriverLog.info("done getting latest samples");
+    if (current == nullptr || !snapShot.has_value()) continue;
+    const auto delta = createDelta(*snapShot, subscription.driver().description(), current);
+    if (delta == nullptr) continue;
+    platform::ioReport().IOReportIterate(delta, [&stats](const IOReportChannel& channel) {
+      addChannel(channel, stats);
+      return 0;
+    });
+  }
+  send(stats.simple, AudioEventType::kSimple, session);
+  send(stats.histogram, AudioEventType::kHistogram, session);
+  send(stats.state, AudioEventType::kState, session);
+}
+
+void HVReportingDriverUtility::addChannel(const IOReportChannel& channel, Stats& stats) {
+  const IOReportFormat format = IOReportChannelGetFormat(channel);
+  const auto number = static_cast<std::uint32_t>(format);
+  switch (format) {
+    case IOReportFormat::kSimple:
+      return processSimpleData(channel, stats.simple);
+    case IOReportFormat::kState:
+      return processStateData(channel, stats.state);
+    case IOReportFormat::kHistogram:
+      return processHistogramData(channel, stats.histogram);
+    case IOReportFormat::kInvalid:
+    case IOReportFormat::kSimpleArray:
+      kDriverLog.debug("Dropping sample of type : ", number,
+                       " for group : ", shown(IOReportChannelGetGroup(channel)),
+                       " subgroup : ", shown(IOReportChannelGetSubGroup(channel)));
+      return;
+  }
+  kDriverLog.error("The IOReportingFormat ", number,
+                   " is not supported group : ", shown(IOReportChannelGetGroup(channel)),
+                   " subgroup : ", shown(IOReportChannelGetSubGroup(channel)));
+}
+
+void HVReportingDriverUtility::processSimpleData(const IOReportChannel& channel,
+                                                 DriverStats& driverStats) {
+  // Zero and negative counts are dropped on purpose.
+  const std::int64_t value = IOReportSimpleGetIntegerValue(channel);
+  if (value < 1) return;
+  driverStats.set(platform::Key(getDriverStatsKey(channel, kSimpleType)), value);
+}
+
+void HVReportingDriverUtility::processHistogramData(const IOReportChannel& channel,
+                                                    DriverStats& driverStats) {
+  const std::int32_t count = IOReportHistogramGetBucketCount(channel);
+  HistogramText histogram = describeBuckets(channel, count);
+  if (histogram.buckets.empty()) return;
+  histogram.buckets.pop_back();  // the last ";"
+  std::string text = "count=" + std::to_string(count) +
+                     ",lower=" + std::to_string(histogram.lower) +
+                     ",upper=" + std::to_string(histogram.upper) +
+                     ",min=" + std::to_string(IOReportHistogramGetMinValue(channel)) +
+                     ",max=" + std::to_string(IOReportHistogramGetMaxValue(channel)) + ",unit=";
+  text += IOReportChannelGetUnitLabel(channel);
+  text += "::";
+  text += histogram.buckets;
+  driverStats.set(platform::Key(getDriverStatsKey(channel, kHistogramType)), std::move(text));
+}
+
+void HVReportingDriverUtility::processStateData(const IOReportChannel& channel,
+                                                DriverStats& driverStats) {
+  std::string text;
+  const std::int32_t count = IOReportStateGetCount(channel);
+  for (std::int32_t index = 0; index < count; ++index) {
+    const std::uint64_t residency = IOReportStateGetResidency(channel, index);
+    if (residency == 0) continue;
+    text += "name:";
+    text += IOReportStateGetNameForIndex(channel, index);
+    text += ",transition:" + std::to_string(IOReportStateGetInTransitions(channel, index)) +
+            ",residency:" + std::to_string(residency) +
+            ",duty_cycle:" + std::to_string(IOReportStateGetDutyCycle(channel, index)) + ";";
+  }
+  kDriverLog.debug("the current reported data is : ", text);
+  // Reported even when no state held at all.
+  driverStats.set(platform::Key(getDriverStatsKey(channel, kStateType)), std::move(text));
+}
+
+std::string HVReportingDriverUtility::getDriverStatsKey(const IOReportChannel& channel,
+                                                        std::string_view type) {
+  std::string key;
+  if (const Name driver = IOReportChannelGetDriverName(channel)) {
+    // What follows the "<" tells one instance of the driver from another.
+    appendKeyPart(key, driver->substr(0, driver->find('<')));
+  }
+  appendKeyPart(key, IOReportChannelGetGroup(channel));
+  appendKeyPart(key, IOReportChannelGetSubGroup(channel));
+  key += type;
+  key += '_';
+  if (const Name name = IOReportChannelGetChannelName(channel)) appendCleaned(key, *name);
+  return key;
+}
+
+}  // namespace halvox

@@ -1,0 +1,80 @@
+#pragma once
+
+#include <map>
+#include <mutex>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/fake/Journal.h"
+#include "platform/ioreport.h"
+
+namespace halvox::platform {
+
+// Driver counters that a test makes up. Groups are named as "Speaker-(null)": group, "-",
+// subgroup. Notes each operation and the group that it is for in the journal. Any thread may call.
+class FakeIOReportService final : public IOReportService {
+ public:
+  // A channel with what it owns.
+  struct Channel {
+    IOReportFormat format = IOReportFormat::kSimple;
+    std::optional<std::string> driverName{};
+    std::optional<std::string> group{};
+    std::optional<std::string> subGroup{};
+    std::optional<std::string> channelName{};
+    std::string unitLabel{};
+    std::int64_t integerValue = 0;
+    std::vector<IOReportState> states{};
+    std::vector<IOReportBucket> buckets{};
+    std::int64_t minValue = 0;
+    std::int64_t maxValue = 0;
+
+    [[nodiscard]] IOReportChannel view() const;
+  };
+  // How an operation ends instead of well: without a result, and with that error if there is one.
+  struct Failure {
+    std::optional<std::int64_t> code{};
+  };
+
+  // Does not own the journal, which must outlive it.
+  explicit FakeIOReportService(Journal& journal) : journal_(journal) {}
+
+  // From now on there is that group, with channels whose differences are these.
+  void setGroup(std::string_view name, std::vector<Channel> channels);
+  // How operations on that group fail from now on.
+  void failChannels(std::string_view name, Failure failure);
+  void failSubscription(std::string_view name, Failure failure);
+  void failSamples(std::string_view name, Failure failure);
+  void failDelta(std::string_view name, Failure failure);
+  // Looking for that group's channels gives an error beside them.
+  void addErrorToChannels(std::string_view name, std::int64_t code);
+
+  Channels IOReportCopyChannelsInGroup(Name group, Name subGroup,
+                                       std::optional<IOReportError>& error) override;
+  [[nodiscard]] std::int32_t IOReportGetChannelCount(const Channels& channels) const override;
+  Subscription IOReportCreateSubscription(const Channels& channels, Channels& subscribedChannels,
+                                          std::optional<IOReportError>& error) override;
+  Samples IOReportCreateSamples(const Subscription& subscription, const Channels& channels,
+                                std::optional<IOReportError>& error) override;
+  // The differences that the test set, whatever the samples; none without both samples.
+  Samples IOReportCreateSamplesDelta(const Samples& previous, const Samples& current,
+                                     std::optional<IOReportError>& error) override;
+  void IOReportIterate(const Samples& samples, const Visitor& visitor) const override;
+
+ private:
+  using Failures = std::map<std::string, Failure, std::less<>>;
+
+  bool fails(const Failures& failures, const std::string& name,
+             std::optional<IOReportError>& error) const;
+
+  Journal& journal_;
+  mutable std::mutex mutex_;
+  std::map<std::string, std::vector<Channel>, std::less<>> groups_;
+  Failures channelFailures_;
+  Failures subscriptionFailures_;
+  Failures sampleFailures_;
+  Failures deltaFailures_;
+  std::map<std::string, std::int64_t, std::less<>> addedErrors_;
+};
+
+}  // namespace halvox::platform

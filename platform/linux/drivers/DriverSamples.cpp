@@ -1,0 +1,151 @@
+#include "platform/linux/drivers/DriverSamples.h"
+
+#include <algorithm>
+#include <span>
+#include <unordered_map>
+#include <utility>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using Numbers = std::span<const std::uint64_t>;
+
+std::optional<std::string_view> view(const std::optional<std::string>& text) {
+  if (!text.has_value()) return std::nullopt;
+  return *text;
+}
+
+std::int64_t asSigned(std::uint64_t number) { return static_cast<std::int64_t>(number); }
+
+Numbers valuesOf(const Reading& reading, std::size_t index) {
+  const ChannelList& channels = *reading.channels;
+  return Numbers(reading.values).subspan(channels.offset(index), channels[index]->valueCount());
+}
+
+// How many of a channel's numbers only grow: all but the minimum and maximum of a histogram.
+std::size_t countedNumbers(const ChannelDescription& channel) {
+  return channel.format == IOReportFormat::kHistogram ? channel.buckets.size()
+                                                      : channel.valueCount();
+}
+
+// A simple channel may be any signed number; all others count up from zero.
+bool wentBackwards(const ChannelDescription& channel, std::uint64_t previous,
+                   std::uint64_t current) {
+  return channel.format == IOReportFormat::kSimple ? asSigned(current) < asSigned(previous)
+                                                   : current < previous;
+}
+
+std::vector<IOReportState> statesOf(const ChannelDescription& channel, Numbers values) {
+  std::uint64_t total = 0;
+  for (std::size_t index = 0; index < channel.states.size(); ++index) {
+    total += values[2 * index + 1];
+  }
+  std::vector<IOReportState> states;
+  states.reserve(channel.states.size());
+  for (std::size_t index = 0; index < channel.states.size(); ++index) {
+    const std::uint64_t residency = values[2 * index + 1];
+    states.push_back(
+        {.name = channel.states[index],
+         .inTransitions = values[2 * index],
+         .residency = residency,
+         // The part of the time that the state held.
+         .dutyCycle =
+             total == 0 ? 0 : static_cast<double>(residency) / static_cast<double>(total)});
+  }
+  return states;
+}
+
+std::vector<IOReportBucket> bucketsOf(const ChannelDescription& channel, Numbers values) {
+  std::vector<IOReportBucket> buckets;
+  buckets.reserve(channel.buckets.size());
+  for (std::size_t index = 0; index < channel.buckets.size(); ++index) {
+    const BucketBounds& bounds = channel.buckets[index];
+    buckets.push_back({.lower = bounds.lower, .upper = bounds.upper, .hits = values[index]});
+  }
+  return buckets;
+}
+
+int show(const ChannelDescription& channel, Numbers values,
+         const IOReportService::Visitor& visitor) {
+  IOReportChannel shown{.format = channel.format,
+                        .driverName = view(channel.driverName),
+                        .group = view(channel.group),
+                        .subGroup = view(channel.subGroup),
+                        .channelName = view(channel.channelName),
+                        .unitLabel = channel.unitLabel};
+  std::vector<IOReportState> states;
+  std::vector<IOReportBucket> buckets;
+  if (channel.format == IOReportFormat::kSimple) {
+    shown.integerValue = asSigned(values[0]);
+  } else if (channel.format == IOReportFormat::kState) {
+    states = statesOf(channel, values);
+    shown.states = states;
+  } else if (channel.format == IOReportFormat::kHistogram) {
+    buckets = bucketsOf(channel, values);
+    shown.buckets = buckets;
+    shown.minValue = asSigned(values[channel.buckets.size()]);
+    shown.maxValue = asSigned(values[channel.buckets.size() + 1]);
+  }
+  return visitor(shown);
+}
+
+// Where the values of each channel are.
+using ValuesByChannel = std::unordered_map<const ChannelDescription*, Numbers>;
+
+ValuesByChannel index(const DriverSamples& samples) {
+  ValuesByChannel values;
+  for (const auto& [reading, selection] : samples.parts()) {
+    for (const std::uint32_t position : *selection) {
+      values.emplace((*reading->channels)[position].get(), valuesOf(*reading, position));
+    }
+  }
+  return values;
+}
+
+void appendDifference(const ChannelDescription& channel, Numbers previous, Numbers current,
+                      std::vector<std::uint64_t>& differences) {
+  const std::size_t counted = countedNumbers(channel);
+  bool isContinued = !previous.empty();
+  for (std::size_t number = 0; isContinued && number < counted; ++number) {
+    isContinued = !wentBackwards(channel, previous[number], current[number]);
+  }
+  for (std::size_t number = 0; number < current.size(); ++number) {
+    const std::uint64_t base = isContinued && number < counted ? previous[number] : 0;
+    differences.push_back(current[number] - base);
+  }
+}
+
+}  // namespace
+
+void DriverSamples::iterate(const IOReportService::Visitor& visitor) const {
+  for (const auto& [reading, selection] : parts_) {
+    for (const std::uint32_t position : *selection) {
+      if (show(*(*reading->channels)[position], valuesOf(*reading, position), visitor) != 0) return;
+    }
+  }
+}
+
+std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
+                                               const DriverSamples& current) {
+  const ValuesByChannel before = index(previous);
+  std::vector<ChannelList::Channel> channels;
+  auto reading = std::make_shared<Reading>();
+  for (const auto& [now, selection] : current.parts()) {
+    for (const std::uint32_t position : *selection) {
+      const ChannelList::Channel& channel = (*now->channels)[position];
+      const auto found = before.find(channel.get());
+      appendDifference(*channel, found == before.end() ? Numbers() : found->second,
+                       valuesOf(*now, position), reading->values);
+      channels.push_back(channel);
+    }
+  }
+  auto all = std::make_shared<ChannelSelection>(channels.size());
+  for (std::size_t position = 0; position < all->size(); ++position) {
+    (*all)[position] = static_cast<std::uint32_t>(position);
+  }
+  reading->channels = std::make_shared<ChannelList>(std::move(channels));
+  return std::make_shared<DriverSamples>(
+      std::vector<DriverSamples::Part>{{std::move(reading), std::move(all)}});
+}
+
+}  // namespace halvox::platform::linux_

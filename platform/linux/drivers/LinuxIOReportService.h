@@ -1,0 +1,43 @@
+#pragma once
+
+#include <memory>
+#include <vector>
+
+#include "platform/ioreport.h"
+#include "platform/linux/drivers/DriverSource.h"
+#include "platform/linux/drivers/SourceReader.h"
+#include "platform/statistics.h"
+
+namespace halvox::platform::linux_ {
+
+// What the kernel, the sound server and other daemons count, as driver channels. A subscription is
+// to a group, not to the channels that are there when it is made: channels that appear later count
+// from zero. No reading holds the caller longer than SourceReader::kLongestWait for each source;
+// what is late is left out.
+//
+// Any thread may call. Owns the sources and their threads, which sleep while nobody asks.
+class LinuxIOReportService final : public IOReportService {
+ public:
+  LinuxIOReportService(std::vector<std::unique_ptr<DriverSource>> sources,
+                       StatisticsService& statistics);
+  ~LinuxIOReportService() override;
+
+  // Opens all sources at once and waits until each has, or has taken too long.
+  void open();
+
+  Channels IOReportCopyChannelsInGroup(Name group, Name subGroup,
+                                       std::optional<IOReportError>& error) override;
+  [[nodiscard]] std::int32_t IOReportGetChannelCount(const Channels& channels) const override;
+  Subscription IOReportCreateSubscription(const Channels& channels, Channels& subscribedChannels,
+                                          std::optional<IOReportError>& error) override;
+  Samples IOReportCreateSamples(const Subscription& subscription, const Channels& channels,
+                                std::optional<IOReportError>& error) override;
+  Samples IOReportCreateSamplesDelta(const Samples& previous, const Samples& current,
+                                     std::optional<IOReportError>& error) override;
+  void IOReportIterate(const Samples& samples, const Visitor& visitor) const override;
+
+ private:
+  std::vector<std::unique_ptr<SourceReader>> readers_;
+};
+
+}  // namespace halvox::platform::linux_

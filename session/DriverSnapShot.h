@@ -1,0 +1,17 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <string>
+
+#include "platform/ioreport.h"
+
+namespace halvox {
+
+// What the drivers had counted when a session started: the samples of each channel group, by the
+// group's description. The session only keeps it; the driver statistics make and read it.
+using DriverSnapShot =
+    std::map<std::string, std::shared_ptr<const platform::IOReportSamples>, std::less<>>;
+
+}  // namespace halvox
