@@ -38,6 +38,7 @@ class NullAnalytics final : public platform::AnalyticsService {
 class SteppingClock final : public platform::ClockService {
  public:
   platform::Date currentDate() const override { return {1.7e9 + 0.001 * ++looks_}; }
+  platform::LocalTime localTime(platform::Date /*date*/) const override { return {}; }
   std::chrono::duration<double> systemUptime() const override {
     return std::chrono::duration<double>(0.001 * looks_);
   }
@@ -72,10 +73,21 @@ class ListQueue final : public platform::DispatchQueue {
   void async(platform::JobWeight /*weight*/, platform::Job job) override {
     jobs_.push_back(std::move(job));
   }
+  // Nothing that is measured waits for another: it goes on at its next turn.
+  void waitOn(std::shared_ptr<platform::DispatchSemaphore> /*semaphore*/,
+              std::optional<std::chrono::nanoseconds> /*timeout*/,
+              std::function<void(platform::WaitOutcome)> then) override {
+    jobs_.push_front([then = std::move(then)] { then(platform::WaitOutcome::kSignalled); });
+  }
   bool isCurrent() const override { return true; }
 
  private:
   std::deque<platform::Job>& jobs_;  // owned by the ListDispatch
+};
+
+class NullSemaphore final : public platform::DispatchSemaphore {
+ public:
+  void signal() override {}
 };
 
 class ListDispatch final : public platform::DispatchService {
@@ -84,6 +96,9 @@ class ListDispatch final : public platform::DispatchService {
       std::string_view /*label*/, platform::QualityOfService /*quality*/,
       platform::QueueThreading /*threading*/) override {
     return std::make_shared<ListQueue>(jobs_);
+  }
+  std::shared_ptr<platform::DispatchSemaphore> createSemaphore(std::uint64_t /*signals*/) override {
+    return std::make_shared<NullSemaphore>();
   }
   void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds /*delay*/,
                                    platform::Job /*job*/) override {}

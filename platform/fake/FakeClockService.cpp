@@ -17,6 +17,11 @@ void FakeClockService::setProcessUptime(std::chrono::milliseconds uptime) {
   processUptime_ = uptime;
 }
 
+void FakeClockService::setOffsetFromUTC(std::chrono::minutes offset) {
+  const std::lock_guard lock(mutex_);
+  offsetFromUTC_ = offset;
+}
+
 void FakeClockService::advance(std::chrono::nanoseconds by) {
   const std::lock_guard lock(mutex_);
   const std::chrono::duration<double> seconds = by;
@@ -28,6 +33,23 @@ void FakeClockService::advance(std::chrono::nanoseconds by) {
 Date FakeClockService::currentDate() const {
   const std::lock_guard lock(mutex_);
   return date_;
+}
+
+LocalTime FakeClockService::localTime(Date date) const {
+  using namespace std::chrono;
+  const std::lock_guard lock(mutex_);
+  const sys_seconds time{seconds(static_cast<std::int64_t>(date.secondsSince1970)) +
+                         offsetFromUTC_};
+  const auto day = floor<days>(time);
+  const year_month_day calendar{day};
+  const hh_mm_ss clock{time - day};
+  return {.year = static_cast<int>(calendar.year()),
+          .month = static_cast<int>(static_cast<unsigned>(calendar.month())),
+          .day = static_cast<int>(static_cast<unsigned>(calendar.day())),
+          .hour = static_cast<int>(clock.hours().count()),
+          .minute = static_cast<int>(clock.minutes().count()),
+          .second = static_cast<int>(clock.seconds().count()),
+          .offsetFromUTC = offsetFromUTC_};
 }
 
 std::chrono::duration<double> FakeClockService::systemUptime() const {

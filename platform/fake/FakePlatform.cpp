@@ -26,6 +26,8 @@ Services FakePlatform::servicesWith(AnalyticsService& otherAnalytics) {
 
 FakePlatform::~FakePlatform() {
   connections.clear();
+  tlmReporting.clear();
+  notify.clear();
   dispatch.clear();
   analytics.clear();
   dispatch.clear();

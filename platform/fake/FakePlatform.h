@@ -11,11 +11,12 @@
 #include "platform/fake/FakeKdebugService.h"
 #include "platform/fake/FakeLogService.h"
 #include "platform/fake/FakeMetricService.h"
-#include "platform/fake/FakePowerLogService.h"
 #include "platform/fake/FakeNotifyService.h"
+#include "platform/fake/FakePowerLogService.h"
 #include "platform/fake/FakePreferenceService.h"
 #include "platform/fake/FakeProcessService.h"
 #include "platform/fake/FakeStatisticsService.h"
+#include "platform/fake/FakeTlmReportingService.h"
 #include "platform/fake/Journal.h"
 #include "platform/services.h"
 
@@ -49,7 +50,7 @@ struct FakePlatform {
   FakeNotifyService notify;
   FakePowerLogService powerLog{journal};
   FakePreferenceService preferences;
-  AbsentTlmReporting tlmReporting;
+  FakeTlmReportingService tlmReporting{journal};
   FakeDispatchService dispatch{clock};
   FakeConnectionService connections{journal};
 };

@@ -16,6 +16,7 @@ enum class JournalKind : unsigned char {
   kMetric,           // text: the metric's identifier in decimal digits
   kPowerEvent,       // text: the event's name
   kSnapshotRequest,  // text: the signature's description
+  kLink,             // text: what the real-time framework was asked for, as "send session 1 4/1"
   kReply,            // text: the name of the method that was answered
   kTermination,      // text: the exit status
   kNote,             // text: whatever the test wrote

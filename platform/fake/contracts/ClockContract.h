@@ -49,7 +49,20 @@ TYPED_TEST_P(ClockContract, DateIsOfThisCentury) {
   EXPECT_LT(date.secondsSince1970, kStartOf2100);
 }
 
+TYPED_TEST_P(ClockContract, LocalTimeIsUTCWithItsOffset) {
+  using namespace std::chrono;
+  const Date date{1'700'000'000.75};  // 2023-11-14 22:13:20 UTC
+
+  const LocalTime local = this->harness_.service().localTime(date);
+
+  const sys_days day = year(local.year) / month(static_cast<unsigned>(local.month)) /
+                       std::chrono::day(static_cast<unsigned>(local.day));
+  const auto time = day + hours(local.hour) + minutes(local.minute) + seconds(local.second);
+  EXPECT_EQ((time - local.offsetFromUTC).time_since_epoch(), seconds(1'700'000'000));
+}
+
 REGISTER_TYPED_TEST_SUITE_P(ClockContract, UptimesMoveOnWithTime,
-                            ProcessHasNotRunLongerThanTheSystem, DateIsOfThisCentury);
+                            ProcessHasNotRunLongerThanTheSystem, DateIsOfThisCentury,
+                            LocalTimeIsUTCWithItsOffset);
 
 }  // namespace halvox::platform::contract

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <charconv>
+#include <cmath>
 #include <cstdint>
 #include <ctime>
 #include <optional>
@@ -60,6 +61,21 @@ LibcClockService::LibcClockService() : processStart_(ownStart()) {}
 
 Date LibcClockService::currentDate() const {
   return {std::chrono::duration<double>(read(CLOCK_REALTIME)).count()};
+}
+
+LocalTime LibcClockService::localTime(Date date) const {
+  constexpr double kFarthest = 1e15;  // some 31 million years, which time_t and tm still hold
+  if (!(std::abs(date.secondsSince1970) <= kFarthest)) return {};
+  const auto time = static_cast<std::time_t>(std::floor(date.secondsSince1970));
+  std::tm local{};
+  if (::localtime_r(&time, &local) == nullptr) return {};
+  return {.year = local.tm_year + 1900,
+          .month = local.tm_mon + 1,
+          .day = local.tm_mday,
+          .hour = local.tm_hour,
+          .minute = local.tm_min,
+          .second = local.tm_sec,
+          .offsetFromUTC = std::chrono::minutes(local.tm_gmtoff / 60)};
 }
 
 std::chrono::duration<double> LibcClockService::systemUptime() const {

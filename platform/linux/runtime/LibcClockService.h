@@ -13,6 +13,7 @@ class LibcClockService final : public ClockService {
   LibcClockService();
 
   [[nodiscard]] Date currentDate() const override;
+  [[nodiscard]] LocalTime localTime(Date date) const override;
   [[nodiscard]] std::chrono::duration<double> systemUptime() const override;
   [[nodiscard]] std::chrono::milliseconds processUptime() const override;
 

@@ -1,7 +1,10 @@
 #include "platform/linux/runtime/LibcClockService.h"
 
 #include <chrono>
+#include <cmath>
+#include <cstdlib>
 #include <fstream>
+#include <string>
 
 #include <gtest/gtest.h>
 
@@ -15,6 +18,35 @@ TEST(LibcClockServiceTest, DateIsThatOfTheSystemClock) {
 
   EXPECT_GE(date, std::chrono::duration<double>(before).count() - 0.001);
   EXPECT_LE(date, std::chrono::duration<double>(after).count() + 0.001);
+}
+
+TEST(LibcClockServiceTest, LocalTimeFollowsTheTimeZone) {
+  const char* before = std::getenv("TZ");
+  const std::string saved = before == nullptr ? "" : before;
+  ::setenv("TZ", "TEST-5:30", 1);  // five and a half hours east of Greenwich
+  ::tzset();
+
+  const LocalTime local = LibcClockService().localTime({1'700'000'000});
+
+  if (before == nullptr) {
+    ::unsetenv("TZ");
+  } else {
+    ::setenv("TZ", saved.c_str(), 1);
+  }
+  ::tzset();
+  const LocalTime expected{.year = 2023,
+                           .month = 11,
+                           .day = 15,
+                           .hour = 3,
+                           .minute = 43,
+                           .second = 20,
+                           .offsetFromUTC = std::chrono::minutes(330)};
+  EXPECT_EQ(local, expected);
+}
+
+TEST(LibcClockServiceTest, ADateBeyondTheCalendarIs1970) {
+  EXPECT_EQ(LibcClockService().localTime({1e300}), LocalTime());
+  EXPECT_EQ(LibcClockService().localTime({std::nan("")}), LocalTime());
 }
 
 TEST(LibcClockServiceTest, SystemUptimeIsThatOfTheKernel) {
