@@ -1,5 +1,6 @@
 #include "platform/linux/runtime/Configuration.h"
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdlib>
@@ -22,9 +23,11 @@ namespace {
 constexpr std::size_t kLargestFile = 1U << 20U;
 constexpr std::size_t kLongestPath = 4000;
 constexpr std::size_t kLongestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
+constexpr std::size_t kLongestStreamName = 255;  // it becomes the name of a directory
 constexpr NumberRange kDays{1, 36'500};
 constexpr NumberRange kMegabytes{1, 1U << 20U};
 constexpr NumberRange kSessions{1, 1'000'000'000};
+constexpr NumberRange kSnapshots{1, 10'000};
 
 const char* configurationVariable() {
   const char* named = std::getenv("HALVOX_CONFIG");
@@ -100,16 +103,81 @@ void readAnalytics(TableReader table, Configuration::Analytics& analytics) {
   table.finish();
 }
 
+// Printable ASCII without blanks, as the names and addresses of the protocol have it.
+bool isGraphic(std::string_view text) {
+  return !text.empty() && std::ranges::all_of(text, [](char character) {
+    return character > ' ' && character <= '~';
+  });
+}
+
+bool isServerURL(std::string_view text) {
+  for (const std::string_view scheme : {"nats://", "tls://"}) {
+    if (text.starts_with(scheme)) return isGraphic(text.substr(scheme.size()));
+  }
+  return false;
+}
+
+// Names between single dots.
+bool isSubject(std::string_view text) {
+  return isGraphic(text) && text.find_first_of("*>") == std::string_view::npos &&
+         text.find("..") == std::string_view::npos && !text.starts_with('.') &&
+         !text.ends_with('.') && !text.starts_with('$');
+}
+
+bool isStreamName(std::string_view text) {
+  return isGraphic(text) && text.size() <= kLongestStreamName &&
+         text.find_first_of("*>./\\") == std::string_view::npos;
+}
+
+void readLinkTls(TableReader table, std::optional<Configuration::Link::Tls>& result) {
+  if (!table.isPresent()) return;
+  Configuration::Link::Tls& tls = result.emplace();
+  table.read("ca", tls.ca, kLongestPath);
+  table.read("certificate", tls.certificate, kLongestPath);
+  table.read("key", tls.key, kLongestPath);
+  table.read("verify", tls.verify);
+  // One of the two alone would be left out in silence, and the servers would refuse us.
+  if (tls.key.empty()) table.refuse("certificate", "a path together with link.tls.key");
+  if (tls.certificate.empty()) table.refuse("key", "a path together with link.tls.certificate");
+  table.finish();
+}
+
+void readLink(TableReader table, Configuration::Link& link) {
+  auto backend = static_cast<std::size_t>(link.backend);
+  table.readChoice("backend", {"local", "nats", "none"}, backend);
+  link.backend = static_cast<LinkBackend>(backend);
+  table.readTexts("servers", isServerURL, "addresses such as \"nats://127.0.0.1:4222\"",
+                  link.servers);
+  table.readText("subject", isSubject, "names between dots, without blanks, * and >", link.subject);
+  table.readText("stream", isStreamName, "a name without blanks, dots, *, >, / and \\",
+                 link.stream);
+  readLinkTls(table.table("tls"), link.tls);
+  table.read("credentials", link.credentials, kLongestPath);
+  table.finish();
+}
+
 void readLimits(TableReader table, Configuration::Limits& limits) {
   table.read("client_history_megabytes", kMegabytes, limits.clientHistoryMegabytes);
   table.read("client_sessions", kSessions, limits.clientSessions);
   table.finish();
 }
 
-void readLog(TableReader table, LogLevel& level) {
+void readLogLevel(TableReader& table, std::string_view key, LogLevel& level) {
   auto chosen = static_cast<std::size_t>(level);
-  table.readChoice("level", {"debug", "info", "default", "error"}, chosen);
+  table.readChoice(key, {"debug", "info", "default", "error"}, chosen);
   level = static_cast<LogLevel>(chosen);
+}
+
+void readLog(TableReader table, Configuration& configuration) {
+  readLogLevel(table, "level", configuration.logLevel);
+  readLogLevel(table, "memory_level", configuration.logMemoryLevel);
+  table.finish();
+}
+
+void readDiagnostics(TableReader table, std::uint32_t& keepSnapshots) {
+  std::uint64_t keep = keepSnapshots;
+  table.read("keep_snapshots", kSnapshots, keep);
+  keepSnapshots = static_cast<std::uint32_t>(keep);
   table.finish();
 }
 
@@ -119,18 +187,9 @@ void readFeatures(TableReader table, FeatureSwitches& features) {
 
 // Tables that are valid in a file but that nothing reads yet: only their types are checked.
 void checkOtherTables(TableReader& root) {
-  std::string text;
-  std::vector<std::string> texts;
   std::filesystem::path path;
-  std::size_t choice = 0;
   bool flag = false;
 
-  TableReader link = root.table("link");
-  link.readChoice("backend", {"local", "nats", "none"}, choice);
-  link.read("servers", texts);
-  link.read("subject", text);
-  link.read("stream", text);
-  link.finish();
   for (const std::string_view name : {"preferences", "notify"}) {
     TableReader table = root.table(name);
     table.read("directory", path, kLongestPath);
@@ -159,8 +218,10 @@ std::variant<Configuration, ConfigurationError> parse(const std::string& file,
   readListener(root.table("listener"), configuration.listener);
   readStorage(root.table("storage"), configuration.storage);
   readAnalytics(root.table("analytics"), configuration.analytics);
+  readLink(root.table("link"), configuration.link);
   readLimits(root.table("limits"), configuration.limits);
-  readLog(root.table("log"), configuration.logLevel);
+  readLog(root.table("log"), configuration);
+  readDiagnostics(root.table("diagnostics"), configuration.keepSnapshots);
   readFeatures(root.table("features"), configuration.features);
   configuration.device = root.table("device").readValues();
   checkOtherTables(root);

@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <functional>
 #include <map>
+#include <optional>
 #include <string>
 #include <variant>
 #include <vector>
@@ -15,6 +16,7 @@
 namespace halvox::platform::linux_ {
 
 enum class BusKind : std::uint8_t { kNone, kSession, kSystem };
+enum class LinkBackend : std::uint8_t { kLocal, kNats, kNone };
 
 // Feature switches by domain and name.
 using FeatureSwitches =
@@ -38,6 +40,21 @@ struct Configuration {
   struct Analytics {
     std::vector<std::string> wanted{"*"};  // glob patterns of event names
   };
+  struct Link {
+    // [link.tls]: a path that is empty was not given; the files are not looked at here.
+    struct Tls {
+      std::filesystem::path ca;           // who signs for the servers; empty: the system's list
+      std::filesystem::path certificate;  // our own, always together with `key`
+      std::filesystem::path key;
+      bool verify = true;  // whether the servers' certificates are checked
+    };
+    LinkBackend backend = LinkBackend::kLocal;
+    std::vector<std::string> servers{"nats://127.0.0.1:4222"};  // at least one
+    std::string subject = "halvox";                             // what all subjects begin with
+    std::string stream = "HALVOX";
+    std::optional<Tls> tls;             // none: as the servers' URLs say
+    std::filesystem::path credentials;  // a NATS credentials file; empty: none
+  };
   struct Limits {
     std::uint64_t clientHistoryMegabytes = 256;
     std::uint64_t clientSessions = 100'000;
@@ -46,8 +63,12 @@ struct Configuration {
   Listener listener;
   Storage storage;
   Analytics analytics;
+  Link link;
   Limits limits;
   LogLevel logLevel = LogLevel::kDefault;
+  // The least level of the lines that stay in memory for captures of diagnostics.
+  LogLevel logMemoryLevel = LogLevel::kInfo;
+  std::uint32_t keepSnapshots = 20;
   Dictionary device;         // [device]: property to value
   FeatureSwitches features;  // [features.Domain]: name to switch
 };

@@ -118,6 +118,35 @@ void TableReader::read(std::string_view key, std::vector<std::string>& result) {
   result = std::move(texts);
 }
 
+void TableReader::readText(std::string_view key, TextForm matches, std::string_view what,
+                           std::string& result) {
+  const toml::node* node = find(key);
+  if (node == nullptr) return;
+  const auto* text = node->as_string();
+  if (text == nullptr || !matches(text->get())) return expected(*node, key, what);
+  result = text->get();
+}
+
+void TableReader::readTexts(std::string_view key, TextForm matches, std::string_view what,
+                            std::vector<std::string>& result) {
+  const toml::node* node = find(key);
+  if (node == nullptr) return;
+  const std::string list = fmt::format("an array of {}", what);
+  const toml::array* array = node->as_array();
+  if (array == nullptr || array->empty()) return expected(*node, key, list);
+  std::vector<std::string> texts;
+  for (const toml::node& element : *array) {
+    const auto* text = element.as_string();
+    if (text == nullptr || !matches(text->get())) return expected(element, key, list);
+    texts.push_back(text->get());
+  }
+  result = std::move(texts);
+}
+
+void TableReader::refuse(std::string_view key, std::string_view what) {
+  if (const toml::node* node = find(key)) expected(*node, key, what);
+}
+
 void TableReader::read(std::string_view key, std::filesystem::path& result, std::size_t longest) {
   const toml::node* node = find(key);
   if (node == nullptr) return;

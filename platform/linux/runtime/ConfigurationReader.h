@@ -52,6 +52,12 @@ class TableReader {
   void read(std::string_view key, bool& result);
   void read(std::string_view key, std::string& result);  // not empty
   void read(std::string_view key, std::vector<std::string>& result);
+  // The same for texts of a form: `matches` tells them, `what` names them to the user. A list has
+  // at least one.
+  using TextForm = bool (*)(std::string_view);
+  void readText(std::string_view key, TextForm matches, std::string_view what, std::string& result);
+  void readTexts(std::string_view key, TextForm matches, std::string_view what,
+                 std::vector<std::string>& result);
   // An absolute path of at most that many bytes; "~/" is expanded.
   void read(std::string_view key, std::filesystem::path& result, std::size_t longest);
   void read(std::string_view key, NumberRange range, std::uint64_t& result);
@@ -64,6 +70,9 @@ class TableReader {
   [[nodiscard]] std::vector<std::pair<std::string, TableReader>> readTables();
   [[nodiscard]] std::map<std::string, bool, std::less<>> readSwitches();
 
+  [[nodiscard]] bool isPresent() const { return table_ != nullptr; }
+  // A mistake of that key, which is present: `what` says what was expected.
+  void refuse(std::string_view key, std::string_view what);
   // Reports each key that nobody read.
   void finish();
 

@@ -203,13 +203,55 @@ TEST_F(ConfigurationTest, FeaturesAreReadByDomain) {
   EXPECT_EQ(configuration.features, expected);
 }
 
-TEST_F(ConfigurationTest, KeysOfOtherPiecesAreKnown) {
-  loaded(R"(
+TEST_F(ConfigurationTest, LinkIsLocalByDefault) {
+  const Configuration::Link link = loaded("").link;
+
+  EXPECT_EQ(link.backend, LinkBackend::kLocal);
+  EXPECT_EQ(link.servers, std::vector<std::string>{"nats://127.0.0.1:4222"});
+  EXPECT_EQ(link.subject, "halvox");
+  EXPECT_EQ(link.stream, "HALVOX");
+  EXPECT_FALSE(link.tls.has_value());
+  EXPECT_TRUE(link.credentials.empty());
+}
+
+TEST_F(ConfigurationTest, EveryKeyOfTheLinkIsTaken) {
+  const Configuration::Link link = loaded(R"(
 [link]
 backend = "nats"
-servers = ["nats://127.0.0.1:4222"]
-subject = "halvox"
-stream = "HALVOX"
+servers = ["nats://a:1", "tls://user:word@b:2"]
+subject = "fleet.audio"
+stream = "AUDIO"
+credentials = "~/halvox.creds"
+[link.tls]
+ca = "/etc/ca.pem"
+certificate = "/etc/own.pem"
+key = "/etc/own.key"
+verify = false
+)")
+                                       .link;
+
+  EXPECT_EQ(link.backend, LinkBackend::kNats);
+  EXPECT_EQ(link.servers, (std::vector<std::string>{"nats://a:1", "tls://user:word@b:2"}));
+  EXPECT_EQ(link.subject, "fleet.audio");
+  EXPECT_EQ(link.stream, "AUDIO");
+  EXPECT_EQ(link.credentials, directory_ / "halvox.creds");
+  ASSERT_TRUE(link.tls.has_value());
+  EXPECT_EQ(link.tls->ca, "/etc/ca.pem");
+  EXPECT_EQ(link.tls->certificate, "/etc/own.pem");
+  EXPECT_EQ(link.tls->key, "/etc/own.key");
+  EXPECT_FALSE(link.tls->verify);
+}
+
+TEST_F(ConfigurationTest, EmptyTlsTableMeansTlsWithTheSystemsAuthorities) {
+  const Configuration::Link link = loaded("[link.tls]").link;
+
+  ASSERT_TRUE(link.tls.has_value());
+  EXPECT_TRUE(link.tls->ca.empty());
+  EXPECT_TRUE(link.tls->verify);
+}
+
+TEST_F(ConfigurationTest, KeysOfOtherPiecesAreKnown) {
+  loaded(R"(
 [preferences]
 directory = "/p"
 [notify]
@@ -276,6 +318,37 @@ INSTANTIATE_TEST_SUITE_P(
                     "2:5: features.A.B: expected true or false, found the string \"on\""},
         MistakeCase{"TypeOfAnotherPiecesKey", "[drivers]\nalsa = 1",
                     "2:8: drivers.alsa: expected true or false, found 1"},
+        MistakeCase{"LinkBackend", "[link]\nbackend = \"remote\"",
+                    "2:11: link.backend: expected \"local\" or \"nats\" or \"none\", found the "
+                    "string \"remote\""},
+        MistakeCase{"NoServers", "[link]\nservers = []",
+                    "2:11: link.servers: expected an array of addresses such as "
+                    "\"nats://127.0.0.1:4222\", found an array"},
+        MistakeCase{"ServerWithoutScheme", "[link]\nservers = [\"nats://a\", \"b:4222\"]",
+                    "2:24: link.servers: expected an array of addresses such as "
+                    "\"nats://127.0.0.1:4222\", found the string \"b:4222\""},
+        MistakeCase{"WildSubject", "[link]\nsubject = \"halvox.>\"",
+                    "2:11: link.subject: expected names between dots, without blanks, * and >, "
+                    "found the string \"halvox.>\""},
+        MistakeCase{"StreamName", "[link]\nstream = \"../up\"",
+                    "2:10: link.stream: expected a name without blanks, dots, *, >, / and \\, "
+                    "found the string \"../up\""},
+        MistakeCase{"TlsAsSwitch", "[link]\ntls = true",
+                    "2:7: link.tls: expected a table, found true"},
+        MistakeCase{"TlsVerify", "[link.tls]\nverify = \"no\"",
+                    "2:10: link.tls.verify: expected true or false, found the string \"no\""},
+        MistakeCase{"CertificateWithoutKey", "[link.tls]\ncertificate = \"/a\"",
+                    "2:15: link.tls.certificate: expected a path together with link.tls.key, "
+                    "found the string \"/a\""},
+        MistakeCase{"KeyWithoutCertificate", "[link.tls]\nkey = \"/a\"",
+                    "2:7: link.tls.key: expected a path together with link.tls.certificate, "
+                    "found the string \"/a\""},
+        MistakeCase{"UnknownTlsKey", "[link.tls]\ncertificates = \"/a\"",
+                    "2:1: link.tls.certificates: expected a known key, found an unknown one; the "
+                    "closest is \"certificate\""},
+        MistakeCase{"RelativeCredentials", "[link]\ncredentials = \"creds\"",
+                    "2:15: link.credentials: expected an absolute path, found the string "
+                    "\"creds\""},
         MistakeCase{"LocalTime", "[device]\nMade = 2024-01-01",
                     "2:8: device.Made: expected a string, a number, a switch, a table, an array "
                     "or a time with its offset, found a date or time"},
