@@ -11,8 +11,6 @@
 namespace halvox {
 namespace {
 
-constexpr std::string_view kTlmReportingQueueLabel = "com.tarno.halvox.session.tlmreporting";
-
 // Answers to starts that nobody will get: their session went without having been stopped.
 platform::Counter& startRepliesDropped() {
   static platform::Counter& counter =
@@ -72,15 +70,6 @@ void HVReportingSession::setTlmReportingEnabled(bool enabled) {
   tlmReportingEnabled_.store(enabled, std::memory_order_relaxed);
 }
 
-const std::shared_ptr<platform::DispatchQueue>& HVReportingSession::tlmReportingQueue() {
-  std::call_once(tlmReportingQueueMade_, [this] {
-    tlmReportingQueue_ = platform::dispatch().createSerialQueue(
-        kTlmReportingQueueLabel, platform::QualityOfService::kUtility,
-        platform::QueueThreading::kShared);
-  });
-  return tlmReportingQueue_;
-}
-
 BoolReply HVReportingSession::transactionCompleteBlock() const {
   return transactionCompleteBlock_.copy();
 }
@@ -137,6 +126,7 @@ void HVReportingSession::start() {
   started_.store(true, std::memory_order_release);
   history_.set(MessageHistory());
   emitTracePoint(ReportingTracePoint::kSessionStarted);
+  if (tlmReportingEnabled()) submitLinkStart();
 }
 
 void HVReportingSession::stop() {
@@ -144,6 +134,10 @@ void HVReportingSession::stop() {
   if (!started()) return;
   kSessionLog.debug("ending session ", number(reporterID_));
   emitTracePoint(ReportingTracePoint::kSessionStopped);
+  sendVolumeMessages();
+  writeSummaryJson();
+  sendSummaryEvent();
+  if (tlmReportingEnabled()) submitLinkStop();
   // Taken out under the lock but destroyed without it: a long history takes its time.
   const std::optional<MessageHistory> history = history_.take();
   charge(history.has_value() ? history->memorySize() : 0, 0);

@@ -12,6 +12,7 @@
 #include "backends/HVReportingVocabulary.h"
 #include "platform/dispatch.h"
 #include "platform/process.h"
+#include "platform/tlm_reporting.h"
 #include "platform/value.h"
 #include "session/Guarded.h"
 #include "session/MessageHistory.h"
@@ -67,6 +68,23 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   void setTlmReportingEnabled(bool enabled);
   // The queue of the session's real-time reporting; made at the first call.
   [[nodiscard]] const std::shared_ptr<platform::DispatchQueue>& tlmReportingQueue();
+  // The framework's session and its token; none unless the link is being opened or open.
+  [[nodiscard]] platform::TLMReportingService::Session tlmReportingSession() const {
+    return tlmReportingSession_.copy();
+  }
+  [[nodiscard]] platform::TLMReportingService::Token tlmReportingAgentToken() const {
+    return tlmReportingAgentToken_.copy();
+  }
+  // Whether the framework found back-ends; may stay true without a session when it was too late.
+  [[nodiscard]] bool tlmReportingSessionStarted() const {
+    return tlmReportingSessionStarted_.load(std::memory_order_acquire);
+  }
+  // The flag itself, to be watched; lives as long as the session.
+  [[nodiscard]] const std::atomic<bool>* getTLMReportingStartedState() const {
+    return &tlmReportingSessionStarted_;
+  }
+  // Gets one signal for each answer of the framework about back-ends; made at the first call.
+  [[nodiscard]] const std::shared_ptr<platform::DispatchSemaphore>& tlmreportingBackendSemaphore();
   // What the client connection wants to call when the session was stopped. The session only keeps
   // it; whoever takes it out calls it.
   [[nodiscard]] BoolReply transactionCompleteBlock() const;
@@ -86,10 +104,23 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   void appendDescription(std::string& text) const;
   [[nodiscard]] bool shouldReportOrientation() const { return false; }
 
-  // Begins a run with an empty history; does nothing to a started session. Never blocks.
+  // Begins a run with an empty history and, with the link enabled, begins to open the link; does
+  // nothing to a started session. Never blocks.
   void start();
-  // Ends the run and forgets its history; does nothing to a session that is not started.
+  // Tells what the run was like (volume messages, the summary file, the summary event), closes the
+  // link behind them, ends the run and forgets its history; does nothing to a session that is not
+  // started. Takes time in proportion to the history, and waits for the disk on internal builds.
   void stop();
+
+  // How long the client played at which volume, as one message an interval that was longer than
+  // that many seconds, in the order in which the intervals ended.
+  [[nodiscard]] static std::vector<platform::Dictionary> createVolumeMessages(
+      const MessageHistory& history, double minimumPlaytime);
+  // Every value that every key took in this run, and the service type; none without messages.
+  [[nodiscard]] platform::Message createSummaryEventForSession() const;
+  // On internal builds, writes the history of this run into a file, unless it is empty. What goes
+  // wrong is logged.
+  void writeSummaryJson() const;
 
   // Records a message in the history unless it repeats the one before it of its category and type.
   // `sync` is accepted and has no effect. The reply, when there is one, is called with none before
@@ -115,10 +146,42 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
  private:
   [[nodiscard]] platform::ProcessID ownerPid() const;  // 0 when there is none
   void charge(std::size_t before, std::size_t after);
-  void record(AudioEventCategory category, AudioEventType type,
+  // True when the message was redundant.
+  bool record(AudioEventCategory category, AudioEventType type,
               const platform::Dictionary& message);
-  void submitAsSingleMessage(const platform::Dictionary& message, AudioEventCategory category,
-                             AudioEventType type);
+
+  // The link; but for the submitting functions, jobs of its queue and callbacks.
+  struct LinkStart;
+  struct LinkMessage {
+    platform::Message original{};  // as the client gave it
+    platform::Dictionary tagged{};
+    AudioEventCategory category{};
+    AudioEventType type{};
+    bool wasStarted = false;
+    bool isRedundant = false;
+    std::size_t bytes = 0;  // charged while it waits
+  };
+  void submitLinkStart();
+  void startLink(const LinkStart& start);
+  static void onBackendsFound(const std::weak_ptr<HVReportingSession>& weakSession,
+                              const std::optional<platform::Array>& backends);
+  void endLinkStart(platform::WaitOutcome outcome);
+  void submitLinkStop();
+  void stopLink();
+  void endLinkStop();
+  void dropLink();
+  void setTlmReportingSessionStarted(bool started) {
+    tlmReportingSessionStarted_.store(started, std::memory_order_release);
+  }
+  void submitToLink(LinkMessage message);
+  [[nodiscard]] std::size_t bytesOf(const LinkMessage& message) const;
+  void sendThroughLink(const LinkMessage& message);
+  void sendAsSingleMessage(const LinkMessage& message);
+
+  void sendVolumeMessages();
+  void sendSummaryEvent();
+  [[nodiscard]] std::string summaryFileName() const;
+  [[nodiscard]] std::size_t historySize() const;
 
   const ReporterID reporterID_;
   std::shared_ptr<ResourceAccount> account_;  // null: nobody is charged
@@ -129,6 +192,12 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   Guarded<BoolReply> transactionCompleteBlock_;
   std::once_flag tlmReportingQueueMade_;
   std::shared_ptr<platform::DispatchQueue> tlmReportingQueue_;
+  std::once_flag backendSemaphoreMade_;
+  std::shared_ptr<platform::DispatchSemaphore> backendSemaphore_;
+  Guarded<platform::TLMReportingService::Session> tlmReportingSession_;
+  Guarded<platform::TLMReportingService::Token> tlmReportingAgentToken_;
+  // Set by the framework's thread before it signals the semaphore; orders with nothing else.
+  std::atomic<bool> tlmReportingSessionStarted_{false};
   // Single values; a reader on another thread that sees one a little late is no harm.
   std::atomic<AudioServiceType> serviceType_{AudioServiceType::kUnknown};
   std::atomic<bool> tlmReportingEnabled_{false};

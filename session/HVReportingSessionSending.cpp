@@ -48,14 +48,21 @@ void HVReportingSession::sendMessage(const platform::Message& message, AudioEven
   kSessionLog.debug("sending message for session owned by ", number(reporterID_));
   const Dictionary tagged = HVReportingUtilityAddAudioMessageTag(
       HVReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(Dictionary())), category, type);
-  record(category, type, tagged);
+  const bool isRedundant = record(category, type, tagged);
   emitTracePoint(ReportingTracePoint::kMessageSent);
   const bool wasStarted = started();
-  if (tlmReportingEnabled() && !wasStarted) submitAsSingleMessage(tagged, category, type);
+  if (tlmReportingEnabled()) {
+    submitToLink({.original = message,
+                  .tagged = tagged,
+                  .category = category,
+                  .type = type,
+                  .wasStarted = wasStarted,
+                  .isRedundant = isRedundant});
+  }
   if (reply) reply(std::nullopt);
 }
 
-void HVReportingSession::record(AudioEventCategory category, AudioEventType type,
+bool HVReportingSession::record(AudioEventCategory category, AudioEventType type,
                                 const Dictionary& message) {
   counters().received.add();
   const HistoryLock history = history_.lock();
@@ -65,6 +72,7 @@ void HVReportingSession::record(AudioEventCategory category, AudioEventType type
   } else {
     (history->has_value() ? counters().recorded : counters().notStarted).add();
   }
+  return redundant;
 }
 
 bool HVReportingSession::createMessageIdentifierWithCategory(const HistoryLock& history,
@@ -85,21 +93,6 @@ bool HVReportingSession::createMessageIdentifierWithCategory(const HistoryLock& 
   messages.append(base, message);
   charge(before, messages.memorySize());
   return false;
-}
-
-void HVReportingSession::submitAsSingleMessage(const Dictionary& message,
-                                               AudioEventCategory category, AudioEventType type) {
-  // The job holds the session: the message belongs to it, and its type and configuration count as
-  // they are when the job runs.
-  tlmReportingQueue()->async(
-      platform::JobWeight::kBrief, [session = shared_from_this(), message, category, type] {
-        kSessionLog.debug(
-            "entering tlmreporting "
-            "-[HVReportingSession sendMessage:category:type:sync:reply:]_block_invoke");
-        kSessionLog.debug("session not started, will send as a single message");
-        sendSingleMessage(message, category, type, session->serviceType(), session->configuration(),
-                          nullptr);
-      });
 }
 
 }  // namespace halvox

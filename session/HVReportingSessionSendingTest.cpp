@@ -209,6 +209,7 @@ TEST_F(HVReportingSessionSendingTest, WithoutAHistoryNothingIsRecordedAndNothing
   EXPECT_FALSE(history->has_value());
 }
 
+// The summary event of the stop is a message like others.
 TEST_F(HVReportingSessionSendingTest, CountsOfMessagesBalance) {
   send({{"a", 1}});
   send({{"a", 1}});
@@ -216,7 +217,7 @@ TEST_F(HVReportingSessionSendingTest, CountsOfMessagesBalance) {
   send({{"a", 1}});
 
   EXPECT_THAT(platform_.statistics.values("session"),
-              UnorderedElementsAre(Pair("received", 3U), Pair("recorded", 1U),
+              UnorderedElementsAre(Pair("received", 4U), Pair("recorded", 2U),
                                    Pair("suppressed: redundant", 1U),
                                    Pair("not recorded: not started", 1U)));
 }

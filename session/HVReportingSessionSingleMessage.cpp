@@ -1,5 +1,6 @@
 #include <atomic>
 #include <chrono>
+#include <optional>
 #include <random>
 #include <utility>
 
@@ -7,35 +8,41 @@
 #include "platform/dispatch.h"
 #include "platform/services.h"
 #include "platform/statistics.h"
+#include "platform/tlm_reporting.h"
 #include "session/HVReportingSession.h"
+#include "session/LinkInfo.h"
 #include "session/SessionLog.h"
 #include "session/TracePoints.h"
 
 namespace halvox {
 namespace {
 
+using platform::Dictionary;
+
 constexpr std::chrono::seconds kSingleMessageDelay{1};
+constexpr std::int64_t kNoLinkSession = -1;  // the framework's session ID outside any session
 constexpr int kMaxAlarmDelta = 59;
 // What may wait for its second at once, in bytes of messages. A flood past it is dropped.
 constexpr std::size_t kMaxPendingBytes = std::size_t{32} * 1024 * 1024;
 // What a waiting message costs beside its content, about: the job and its timer.
 constexpr std::size_t kPendingOverhead = 256;
 
-// received = suppressed + dropped + sent; nothing is sent without a real-time framework.
+// received = sent + failed + suppressed + dropped + those that wait for their second.
 struct SingleMessageCounters {
   platform::Counter& received;
+  platform::Counter& sent;
+  platform::Counter& failed;
   platform::Counter& sampled;
   platform::Counter& tooManyWaiting;
-  platform::Counter& noFramework;
 };
 
 const SingleMessageCounters& counters() {
   constexpr std::string_view kPiece = "single messages";
   platform::StatisticsService& statistics = platform::statistics();
   static const SingleMessageCounters made{
-      statistics.counter(kPiece, "received"), statistics.counter(kPiece, "suppressed: sampled"),
-      statistics.counter(kPiece, "dropped: too many waiting"),
-      statistics.counter(kPiece, "dropped: no real-time framework")};
+      statistics.counter(kPiece, "received"), statistics.counter(kPiece, "sent"),
+      statistics.counter(kPiece, "failed"), statistics.counter(kPiece, "suppressed: sampled"),
+      statistics.counter(kPiece, "dropped: too many waiting")};
   return made;
 }
 
@@ -78,16 +85,55 @@ std::int64_t drawDelta(AudioServiceType serviceType) {
   return std::uniform_int_distribution<int>(0, kMaxAlarmDelta)(generator);
 }
 
-void sendNow(const platform::Message& message, const ErrorReply& reply) {
+// One message on its way to the framework.
+struct SingleMessage {
+  platform::Message message;
+  AudioEventCategory category;
+  AudioEventType type;
+  AudioServiceType serviceType;
+};
+
+// Sends the message; the error when there is one to tell.
+std::optional<platform::Error> handOver(const SingleMessage& single) {
+  const Dictionary sessionInfo{
+      {platform::kTLMReportingSessionInfoClientType, kLinkClientType},
+      {platform::kTLMReportingSessionInfoClientVersion, kHVReportingVersionNumber},
+      {platform::kTLMReportingSessionInfoSessionID, kNoLinkSession}};
+  const Dictionary userInfo{
+      {platform::kTLMReportingUserInfoClientName, kLinkClientName},
+      {platform::kTLMReportingUserInfoServiceName,
+       HVReportingUtilityGenerateServiceNameFromServiceType(single.serviceType)}};
+  const Dictionary payload =
+      HVReportingUtilityRemoveWhiteSpaceFromKeys(single.message.value_or(Dictionary()));
+  platform::TLMReportingOutcome outcome = platform::tlmReporting().TLMReportingSendOneMessage(
+      sessionInfo, userInfo,
+      {.category = HVReportingUtilityRetrieveTLMReportingCategoryFromCategory(single.category),
+       .type = number(single.type),
+       .payload = payload});
+  if (outcome.sent) {
+    counters().sent.add();
+    kSessionLog.debug("message ", single.message, " : category ", number(single.category),
+                      " : type ", number(single.type));
+    return std::nullopt;
+  }
+  counters().failed.add();
+  if (outcome.error.has_value()) {
+    kSessionLog.error("sendOneMessageWithSessionInfo ", outcome.error->description);
+  }
+  return std::move(outcome.error);
+}
+
+void sendNow(const SingleMessage& single, const ErrorReply& reply) {
   emitTracePoint(ReportingTracePoint::kMessageSent);
   kSessionLog.debug("sending single message");
+  std::optional<platform::Error> error;
   if (HVReportingUtilityShouldSendMessage()) {
-    counters().noFramework.add();
+    error = handOver(single);
   } else {
     counters().sampled.add();
-    kSessionLog.info("event sampled ", message);
+    kSessionLog.info("event sampled ", single.message);
   }
-  if (reply) reply(std::nullopt);
+  if (reply) reply(error);
 }
 
 void refuse(const ErrorReply& reply) {
@@ -101,7 +147,7 @@ void refuse(const ErrorReply& reply) {
 }  // namespace
 
 void HVReportingSession::sendSingleMessage(const platform::Message& message,
-                                           AudioEventCategory /*category*/, AudioEventType /*type*/,
+                                           AudioEventCategory category, AudioEventType type,
                                            AudioServiceType serviceType,
                                            const platform::Dictionary& /*userInfo*/,
                                            const ErrorReply& reply) {
@@ -114,8 +160,11 @@ void HVReportingSession::sendSingleMessage(const platform::Message& message,
     refuse(reply);
     return;
   }
+  // The job runs in a small pool that all share, and blocks nobody: the framework waits for no
+  // server.
   platform::dispatch().asyncAfterOnBackgroundQueue(
-      kSingleMessageDelay, [message, reply, place = std::move(place)] { sendNow(message, reply); });
+      kSingleMessageDelay, [single = SingleMessage{message, category, type, serviceType}, reply,
+                            place = std::move(place)] { sendNow(single, reply); });
 }
 
 }  // namespace halvox

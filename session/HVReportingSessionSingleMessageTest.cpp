@@ -60,7 +60,10 @@ TEST_F(HVReportingSessionSingleMessageTest, GoesOutAfterOneSecondOnTheBackground
   platform_.dispatch.advance(1ms);
   EXPECT_THAT(platform_.journal.entries(),
               ElementsAre(JournalEntry{JournalKind::kTracePoint, "0x21044838"},
-                          JournalEntry{JournalKind::kLogLine, "sending single message"}));
+                          JournalEntry{JournalKind::kLogLine, "sending single message"},
+                          JournalEntry{JournalKind::kLink, "send single 4/1"},
+                          JournalEntry{JournalKind::kLogLine,
+                                       "message {a = 1} : category 4 : type 1"}));
   EXPECT_EQ(platform_.log.lines().back().level, LogLevel::kDebug);
 }
 
@@ -98,9 +101,84 @@ TEST_F(HVReportingSessionSingleMessageTest, EveryMessageIsAccountedFor) {
   send(AudioServiceType::kHaptics);
   send(AudioServiceType::kHaptics);
   platform_.dispatch.advance(1s);
+  platform_.tlmReporting.setOutcome({.sent = false});
+  send(AudioServiceType::kHaptics);
+  platform_.dispatch.advance(1s);
 
-  EXPECT_EQ(platform_.statistics.value("single messages", "received"), 2U);
-  EXPECT_EQ(platform_.statistics.value("single messages", "dropped: no real-time framework"), 2U);
+  EXPECT_THAT(platform_.statistics.values("single messages"),
+              testing::UnorderedElementsAre(testing::Pair("received", 3U),
+                                            testing::Pair("sent", 2U), testing::Pair("failed", 1U)));
+}
+
+TEST_F(HVReportingSessionSingleMessageTest, TellsTheFrameworkThatItHasNoSession) {
+  send(AudioServiceType::kHaptics);
+  platform_.dispatch.advance(1s);
+
+  const auto infos = platform_.tlmReporting.singleMessageInfos();
+  ASSERT_EQ(infos.size(), 1U);
+  EXPECT_EQ(infos[0].sessionInfo, (Dictionary{{"TLMReportingSessionInfoClientType", 19},
+                                              {"TLMReportingSessionInfoClientVersion", 2.1},
+                                              {"TLMReportingSessionInfoSessionID", -1}}));
+}
+
+TEST_F(HVReportingSessionSingleMessageTest, TellsTheFrameworkTheServiceAndNothingOfTheUserInfo) {
+  send(AudioServiceType::kHaptics);
+  platform_.dispatch.advance(1s);
+
+  const auto infos = platform_.tlmReporting.singleMessageInfos();
+  ASSERT_EQ(infos.size(), 1U);
+  EXPECT_EQ(infos[0].userInfo, (Dictionary{{"TLMReportingUserInfoClientName", "com.tarno.halvox"},
+                                           {"TLMReportingUserInfoServiceName", "haptics"}}));
+}
+
+TEST_F(HVReportingSessionSingleMessageTest, SendsCleanKeysAndTheCategoryWithoutItsDomain) {
+  HVReportingSession::sendSingleMessage(
+      Dictionary{{"sample rate", 48000}}, AudioEventCategory::kToolbox | AudioEventCategory::kError,
+      AudioEventType::kState, AudioServiceType::kHaptics, {}, nullptr);
+  platform_.dispatch.advance(1s);
+
+  const auto sent = platform_.tlmReporting.singleMessages();
+  ASSERT_EQ(sent.size(), 1U);
+  EXPECT_EQ(sent[0].category, 11);
+  EXPECT_EQ(sent[0].type, 18);
+  EXPECT_EQ(sent[0].payload, (Dictionary{{"sample_rate", 48000}}));
+  EXPECT_TRUE(platform_.log.containsText(
+      "message {sample rate = 48000} : category -2147483637 : type 18"));
+}
+
+TEST_F(HVReportingSessionSingleMessageTest, NoMessageAtAllIsSentEmpty) {
+  HVReportingSession::sendSingleMessage(std::nullopt, AudioEventCategory::kPlayback,
+                                        AudioEventType::kStart, AudioServiceType::kHaptics, {},
+                                        nullptr);
+  platform_.dispatch.advance(1s);
+
+  ASSERT_EQ(platform_.tlmReporting.singleMessages().size(), 1U);
+  EXPECT_TRUE(platform_.tlmReporting.singleMessages()[0].payload.empty());
+  EXPECT_TRUE(platform_.log.containsText("message (null) : category 4 : type 1"));
+}
+
+TEST_F(HVReportingSessionSingleMessageTest, AFailureWithAnErrorIsLoggedAndReplied) {
+  const platform::Error error{.domain = "link", .code = 3, .description = "no route"};
+  platform_.tlmReporting.setOutcome({.sent = false, .error = error});
+  std::vector<std::optional<platform::Error>> replies;
+
+  send(AudioServiceType::kHaptics, {}, [&](const auto& given) { replies.push_back(given); });
+  platform_.dispatch.advance(1s);
+
+  EXPECT_THAT(platform_.log.texts(LogLevel::kError),
+              ElementsAre("sendOneMessageWithSessionInfo no route"));
+  EXPECT_THAT(replies, ElementsAre(error));
+}
+
+TEST_F(HVReportingSessionSingleMessageTest, AFailureWithoutAnErrorIsSilentAndRepliedWithNone) {
+  platform_.tlmReporting.setOutcome({.sent = false});
+  std::vector<std::optional<platform::Error>> replies;
+
+  send(AudioServiceType::kHaptics, {}, [&](const auto& given) { replies.push_back(given); });
+  platform_.dispatch.advance(1s);
+
+  EXPECT_EQ(platform_.log.texts().back(), "sending single message");
+  EXPECT_THAT(replies, ElementsAre(std::nullopt));
 }
 
 TEST_F(HVReportingSessionSingleMessageTest, AFloodIsDroppedPastABoundAndLoggedOnce) {

@@ -17,5 +17,10 @@ constexpr std::int64_t number(ReporterID reporterID) {
 constexpr std::uint16_t number(AudioServiceType serviceType) {
   return static_cast<std::uint16_t>(serviceType);
 }
+// Signed, as categories have always been logged.
+constexpr std::int32_t number(AudioEventCategory category) {
+  return static_cast<std::int32_t>(category);
+}
+constexpr std::uint16_t number(AudioEventType type) { return static_cast<std::uint16_t>(type); }
 
 }  // namespace halvox

@@ -1,0 +1,62 @@
+#include "session/SummaryEvent.h"
+
+#include <utility>
+
+#include "session/SessionLog.h"
+
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+using platform::Key;
+using platform::Value;
+
+const Key kServiceTypeKey("HV_Session_Summary_Event");
+
+void appendText(std::string& text, const Value& value) {
+  if (value.isString()) {
+    text += value.string();
+  } else {
+    text += platform::describe(value);
+  }
+}
+
+}  // namespace
+
+// A message may carry that key too: its values then follow the service type.
+SummaryEvent::SummaryEvent(AudioServiceType serviceType) {
+  appendText(columnOf(kServiceTypeKey).text, number(serviceType));
+}
+
+void SummaryEvent::add(const Dictionary& message) {
+  for (const Dictionary::Entry& entry : message) {
+    const std::size_t known = columns_.size();
+    Column& column = columnOf(entry.key);
+    if (columns_.size() == known) column.text += ',';
+    appendText(column.text, entry.value);
+  }
+}
+
+SummaryEvent::Column& SummaryEvent::columnOf(const Key& key) {
+  if (likely_ >= columns_.size() || !(columns_[likely_].key == key)) {
+    const auto [place, isNew] = positions_.try_emplace(key, columns_.size());
+    if (isNew) columns_.push_back({key, {}});
+    likely_ = place->second;
+  }
+  return columns_[likely_++];
+}
+
+Dictionary SummaryEvent::take() {
+  positions_.clear();
+  Dictionary event;
+  event.reserve(columns_.size());
+  for (Column& column : columns_) {
+    event.set(column.key, Value(column.text));
+    std::string().swap(column.text);  // at once: the texts of a long history are large
+  }
+  columns_.clear();
+  likely_ = 0;
+  return event;
+}
+
+}  // namespace halvox

@@ -1,0 +1,92 @@
+#include "session/VolumeMessages.h"
+
+#include <utility>
+
+#include "backends/HVReportingUtility.h"
+
+namespace halvox {
+namespace {
+
+using platform::Array;
+using platform::Dictionary;
+using platform::Key;
+using platform::Value;
+
+const Key kFormatKey("session_selected_format");
+const Key kDevicesKey("active_devices");
+const Key kProcessKey("RQSessionVolumeOperationProcess");
+const Key kVolumeKey("RQSessionVolume");
+const Key kPlayingKey("RQSessionVolumePlayingState");
+const Key kTimestampKey("hvreporting_timestamp");
+const Key kVolumeBucketedKey("RQSessionVolumeBucketed");
+const Key kPlaySecondsKey("play_seconds");
+const Key kPlaySecondsBucketedKey("play_secondsBucketed");
+
+constexpr int kVolumeFractionDigits = 4;
+constexpr int kSecondsFractionDigits = 0;
+
+const Array& volumeBuckets() {
+  static const Array buckets{0,      0.0625, 0.125,  0.1875, 0.25,   0.3125, 0.375,  0.4375, 0.5,
+                             0.5625, 0.625,  0.6875, 0.75,   0.8125, 0.875,  0.9375, 1.0};
+  return buckets;
+}
+
+const Array& secondsBuckets() {
+  static const Array buckets{0, 1, 5, 10, 30, 60, 300, 1800, 3600, 7200, 18000};
+  return buckets;
+}
+
+Value bucketed(const Value& number, const Array& buckets, int fractionDigits) {
+  const auto text = HVReportingUtilityBucketNumberToString(number, buckets, fractionDigits);
+  return text.has_value() ? Value(*text) : Value();
+}
+
+void keepIfPresent(const Dictionary& message, const Key& key, Value& kept) {
+  if (const Value* value = message.find(key)) kept = *value;
+}
+
+std::optional<double> stampOf(const Dictionary& message) {
+  const Value* stamp = message.find(kTimestampKey);
+  if (stamp == nullptr || !stamp->isNumber()) return std::nullopt;
+  return stamp->toDouble();
+}
+
+bool saysPlaying(const Dictionary& message) {
+  const Value* state = message.find(kPlayingKey);
+  return state != nullptr && state->toInt64() != 0;
+}
+
+}  // namespace
+
+std::optional<Dictionary> VolumeIntervals::add(const Dictionary& message) {
+  keepIfPresent(message, kFormatKey, format_);
+  keepIfPresent(message, kDevicesKey, devices_);
+  keepIfPresent(message, kProcessKey, process_);
+  const Value* given = message.find(kVolumeKey);
+  if (given == nullptr) return std::nullopt;
+  Value volume = given->isNumber() ? *given : Value(0);
+  const bool isPlaying = saysPlaying(message);
+  if (start_.has_value() && isPlaying && volume == lastVolume_) return std::nullopt;
+
+  const std::optional<double> stamp = stampOf(message);
+  std::optional<Dictionary> ended;
+  if (start_.has_value()) {
+    const double seconds = stamp.value_or(0) - *start_;
+    if (seconds > minimumPlaytime_) ended = makeMessage(seconds);
+  }
+  start_ = isPlaying ? stamp : std::nullopt;
+  lastVolume_ = std::move(volume);
+  return ended;
+}
+
+Dictionary VolumeIntervals::makeMessage(double seconds) const {
+  return {{kFormatKey, format_},
+          {kDevicesKey, devices_},
+          {kProcessKey, process_},
+          {kVolumeKey, lastVolume_},
+          {kVolumeBucketedKey, bucketed(lastVolume_, volumeBuckets(), kVolumeFractionDigits)},
+          {kPlaySecondsKey, static_cast<float>(seconds)},
+          {kPlaySecondsBucketedKey, bucketed(seconds, secondsBuckets(), kSecondsFractionDigits)}};
+}
+
+}  // namespace halvox
