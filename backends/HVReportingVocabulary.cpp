@@ -32,4 +32,19 @@ platform::LogCategory& HVReportingSessionTLMReportingCategory() {
   return category;
 }
 
+platform::LogCategory& HVReportingJoulebookCategory() {
+  static platform::LogCategory& category = makeCategory("hvrp");
+  return category;
+}
+
+platform::LogCategory& HVReportingZUBLogCategory() {
+  static platform::LogCategory& category = makeCategory("hvra");
+  return category;
+}
+
+platform::LogCategory& HVReportingVEKLogCategory() {
+  static platform::LogCategory& category = makeCategory("hvrb");
+  return category;
+}
+
 }  // namespace halvox

@@ -98,5 +98,8 @@ platform::LogCategory& HVReportingClientCategory();
 platform::LogCategory& HVReportingServiceDelegateCategory();
 platform::LogCategory& HVReportingSessionCategory();
 platform::LogCategory& HVReportingSessionTLMReportingCategory();
+platform::LogCategory& HVReportingJoulebookCategory();
+platform::LogCategory& HVReportingZUBLogCategory();
+platform::LogCategory& HVReportingVEKLogCategory();
 
 }  // namespace halvox

@@ -31,6 +31,9 @@ TEST_F(HVReportingVocabularyTest, LogCategoriesHaveTheirNamesInTheSubsystem) {
   EXPECT_EQ(namesOf(HVReportingServiceDelegateCategory()), "com.tarno.halvox/hvrs");
   EXPECT_EQ(namesOf(HVReportingSessionCategory()), "com.tarno.halvox/hvrr");
   EXPECT_EQ(namesOf(HVReportingSessionTLMReportingCategory()), "com.tarno.halvox/hvri");
+  EXPECT_EQ(namesOf(HVReportingJoulebookCategory()), "com.tarno.halvox/hvrp");
+  EXPECT_EQ(namesOf(HVReportingZUBLogCategory()), "com.tarno.halvox/hvra");
+  EXPECT_EQ(namesOf(HVReportingVEKLogCategory()), "com.tarno.halvox/hvrb");
 }
 
 TEST_F(HVReportingVocabularyTest, LogCategoriesAreMadeOnce) {
@@ -38,6 +41,9 @@ TEST_F(HVReportingVocabularyTest, LogCategoriesAreMadeOnce) {
   EXPECT_EQ(&HVReportingServiceDelegateCategory(), &HVReportingServiceDelegateCategory());
   EXPECT_EQ(&HVReportingSessionCategory(), &HVReportingSessionCategory());
   EXPECT_EQ(&HVReportingSessionTLMReportingCategory(), &HVReportingSessionTLMReportingCategory());
+  EXPECT_EQ(&HVReportingJoulebookCategory(), &HVReportingJoulebookCategory());
+  EXPECT_EQ(&HVReportingZUBLogCategory(), &HVReportingZUBLogCategory());
+  EXPECT_EQ(&HVReportingVEKLogCategory(), &HVReportingVEKLogCategory());
 }
 
 TEST_F(HVReportingVocabularyTest, DomainAndCategoryAreJoinedBitwise) {

@@ -1,0 +1,117 @@
+#include "backends/HVReportingUtilityVEKStateManager.h"
+
+#include <optional>
+#include <utility>
+
+#include "backends/HVReportingUtility.h"
+#include "platform/diagnostic_reporter.h"
+#include "platform/log.h"
+#include "platform/services.h"
+#include "platform/statistics.h"
+#include "session/HVReportingSession.h"
+
+namespace halvox {
+
+using platform::Dictionary;
+using platform::Key;
+
+namespace {
+
+constexpr platform::UnitLog kLog(&HVReportingVEKLogCategory, "HVReportingUtilityVEKStateManager");
+
+constexpr std::string_view kSignatureDomain = "Acoustat";
+// How many reports are counted before the one that brings a snapshot.
+constexpr std::uint64_t kReportsBeforeSnapshot = 1;
+// The capture is of the state as it is, not of what is still to come.
+constexpr double kSnapshotSeconds = 0;
+
+// received = delivered (to the bug-capture service) + suppressed.
+struct LeakCounters {
+  platform::Counter& received;
+  platform::Counter& delivered;
+  platform::Counter& counted;
+  platform::Counter& repeated;
+};
+
+const LeakCounters& counters() {
+  constexpr std::string_view kPiece = "bug capture bridge";
+  platform::StatisticsService& statistics = platform::statistics();
+  static const LeakCounters made{statistics.counter(kPiece, "received"),
+                                 statistics.counter(kPiece, "delivered"),
+                                 statistics.counter(kPiece, "suppressed: first of two"),
+                                 statistics.counter(kPiece, "suppressed: repeated")};
+  return made;
+}
+
+}  // namespace
+
+void HVReportingUtilityVEKStateManager::handleEvent(
+    const platform::Message& message, AudioEventCategory category, AudioEventType type,
+    const std::shared_ptr<HVReportingSession>& session, std::string_view processName) {
+  if (type != AudioEventType::kJoulebook || !message.has_value()) return;
+  static const Key activeTime("Haptic_Active_Hardware_Time_Seconds");
+  if (message->find(activeTime) == nullptr) return;
+  counters().received.add();
+  if (*message == messageCache()) {
+    counters().repeated.add();
+    return;
+  }
+  if (leakedHapticsSessionCounter() == kReportsBeforeSnapshot) {
+    takeSnapshot(category, *session, processName);
+    counters().delivered.add();
+    return;
+  }
+  setMessageCache(*message);
+  kLog.info("Incrementing VEK counter. ", processName);
+  setLeakedHapticsSessionCounter(leakedHapticsSessionCounter() + 1);
+  counters().counted.add();
+}
+
+void HVReportingUtilityVEKStateManager::takeSnapshot(AudioEventCategory category,
+                                                     const HVReportingSession& session,
+                                                     std::string_view processName) {
+  kLog.info("Getting snapshot with Ailment Reporter");
+  const Reporter reporter = platform::diagnosticReporters().createReporter();
+  setAilmentReporter(reporter);
+  const Dictionary signature = reporter->makeSignature(
+      kSignatureDomain, HVReportingUtilityGenerateServiceNameFromServiceType(session.serviceType()),
+      HVReportingUtilityCategoryString(category),
+      HVReportingUtilityTypeString(AudioEventType::kJoulebook), processName, std::nullopt);
+  reporter->requestSnapshot(
+      signature, kSnapshotSeconds, std::nullopt, std::nullopt,
+      [](const Dictionary& response) { kLog.info("Response from ailmentReporter : ", response); });
+  setLeakedHapticsSessionCounter(0);
+  setMessageCache({});
+}
+
+std::uint64_t HVReportingUtilityVEKStateManager::leakedHapticsSessionCounter() const {
+  return leakedHapticsSessionCounter_.load(std::memory_order_relaxed);
+}
+
+void HVReportingUtilityVEKStateManager::setLeakedHapticsSessionCounter(std::uint64_t count) {
+  leakedHapticsSessionCounter_.store(count, std::memory_order_relaxed);
+}
+
+HVReportingUtilityVEKStateManager::Reporter HVReportingUtilityVEKStateManager::ailmentReporter()
+    const {
+  const std::lock_guard held(mutex_);
+  return ailmentReporter_;
+}
+
+// What was there before is destroyed without the lock.
+void HVReportingUtilityVEKStateManager::setAilmentReporter(Reporter reporter) {
+  const std::lock_guard held(mutex_);
+  std::swap(ailmentReporter_, reporter);
+}
+
+Dictionary HVReportingUtilityVEKStateManager::messageCache() const {
+  const std::lock_guard held(mutex_);
+  return messageCache_;
+}
+
+void HVReportingUtilityVEKStateManager::setMessageCache(Dictionary message) {
+  const std::lock_guard held(mutex_);
+  std::swap(messageCache_, message);
+}
+
+}  // namespace halvox

@@ -1,0 +1,96 @@
+#include "backends/HVReportingZUBBridge.h"
+
+#include <algorithm>
+#include <charconv>
+#include <limits>
+#include <string>
+#include <string_view>
+#include <system_error>
+
+#include "backends/AudioIssueDetected.h"
+#include "platform/log.h"
+#include "platform/metrics.h"
+#include "platform/services.h"
+#include "platform/statistics.h"
+
+namespace halvox {
+
+using platform::Dictionary;
+using platform::Key;
+using platform::Value;
+
+namespace {
+
+constexpr platform::UnitLog kLog(&HVReportingZUBLogCategory, "HVReportingZUBBridge");
+
+const Value* findOrLog(const Dictionary& message, const Key& key) {
+  const Value* value = message.find(key);
+  if (value == nullptr) kLog.error("Failed to get ", key.text(), " for AudioIssueDetected");
+  return value;
+}
+
+std::string textUnder(const Dictionary& message, const Key& key) {
+  const Value* value = findOrLog(message, key);
+  return value == nullptr ? std::string() : describe(*value);
+}
+
+// The integer that a text begins with, behind blanks; 0 without one, the nearest end when it is too
+// large.
+std::int64_t leadingInteger(std::string_view text) {
+  using Limits = std::numeric_limits<std::int64_t>;
+  text.remove_prefix(std::min(text.find_first_not_of(" \t"), text.size()));
+  const bool negative = text.starts_with('-');
+  if (text.starts_with('+') && !text.starts_with("+-")) text.remove_prefix(1);
+  std::int64_t integer = 0;
+  const auto [end, failure] = std::from_chars(text.begin(), text.end(), integer);
+  if (failure == std::errc::result_out_of_range) return negative ? Limits::min() : Limits::max();
+  return integer;
+}
+
+std::int32_t secondsUnder(const Dictionary& message, const Key& key) {
+  const Value* value = findOrLog(message, key);
+  if (value == nullptr) return 0;
+  const std::int64_t seconds =
+      value->isString() ? leadingInteger(value->string()) : value->toInt64();
+  return static_cast<std::int32_t>(seconds);
+}
+
+// The fields in the order in which missing ones are logged.
+zubmetrics::AudioIssueDetected makeMetric(const Dictionary& message) {
+  static const Key issueType("issue_type");
+  static const Key rtaidClient("rtaid_client");
+  static const Key node("node");
+  static const Key silence("any_channel_silence_seconds");
+  zubmetrics::AudioIssueDetected metric;
+  metric.setIssueType(textUnder(message, issueType));
+  metric.setRtaidClient(textUnder(message, rtaidClient));
+  metric.setNode(textUnder(message, node));
+  metric.setDuration(secondsUnder(message, silence));
+  return metric;
+}
+
+// received = delivered.
+struct IssueCounters {
+  platform::Counter& received;
+  platform::Counter& delivered;
+};
+
+const IssueCounters& counters() {
+  platform::StatisticsService& statistics = platform::statistics();
+  static const IssueCounters made{statistics.counter("issue metrics bridge", "received"),
+                                  statistics.counter("issue metrics bridge", "delivered")};
+  return made;
+}
+
+}  // namespace
+
+void HVReportingZUBBridge::handleEvent(const platform::Message& message,
+                                       AudioEventCategory /*category*/, AudioEventType type,
+                                       const std::shared_ptr<HVReportingSession>& /*session*/) {
+  if (type != AudioEventType::kIssueDetector || !message.has_value()) return;
+  counters().received.add();
+  platform::metrics().postIssueMetric(kAudioIssueDetectedMetricID, makeMetric(*message));
+  counters().delivered.add();
+}
+
+}  // namespace halvox
