@@ -187,13 +187,18 @@ struct NullPlatform {
                                .dispatch = dispatch,
                                .featureFlags = featureFlags,
                                .files = files,
+                               .ioReport = ioReport,
                                .kdebug = kdebug,
+                               .ktrace = ktrace,
                                .log = log,
                                .metrics = metrics,
                                .notify = notify,
+                               .performanceTraces = performanceTraces,
                                .powerLog = powerLog,
                                .preferences = preferences,
                                .process = process,
+                               .propertyLists = propertyLists,
+                               .resultsFiles = resultsFiles,
                                .statistics = statistics,
                                .tlmReporting = tlmReporting});
   }
@@ -212,6 +217,11 @@ struct NullPlatform {
   ListDispatch dispatch;
   NullFeatureFlags featureFlags;
   NullKdebug kdebug;
+  platform::AbsentIOReport ioReport;
+  platform::AbsentKtrace ktrace;
+  platform::AbsentPerformanceTraces performanceTraces;
+  platform::AbsentPropertyLists propertyLists;
+  platform::AbsentResultsFiles resultsFiles;
   NullLog log;
   NullProcess process;
   MapStatistics statistics;

@@ -45,7 +45,7 @@ class DispatchQueue {
   // queues only.
   virtual void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
                       std::optional<std::chrono::nanoseconds> timeout,
-                      std::function<void(WaitOutcome)> then);
+                      std::function<void(WaitOutcome)> then) = 0;
   // True on the thread that is running a job of this queue right now.
   [[nodiscard]] virtual bool isCurrent() const = 0;
 };
@@ -61,7 +61,7 @@ class DispatchService {
                                                            QualityOfService quality,
                                                            QueueThreading threading) = 0;
   // A new semaphore with that many signals in it.
-  virtual std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals);
+  virtual std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals) = 0;
   // Runs the job on the background-priority global queue after that delay, in no order with
   // others. Costs no thread while it waits.
   virtual void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) = 0;

@@ -17,6 +17,7 @@
 #include "platform/fake/Journal.h"
 #include "platform/fake/contracts/ClockContract.h"
 #include "platform/fake/contracts/DispatchContract.h"
+#include "platform/fake/contracts/DispatchWaitContract.h"
 #include "platform/fake/contracts/LogContract.h"
 #include "platform/fake/contracts/ProcessContract.h"
 #include "platform/fake/contracts/StatisticsContract.h"
@@ -102,6 +103,7 @@ class LogHarness {
 }  // namespace fakes
 
 INSTANTIATE_TYPED_TEST_SUITE_P(Fake, DispatchContract, fakes::DispatchHarness);
+INSTANTIATE_TYPED_TEST_SUITE_P(Fake, DispatchWaitContract, fakes::DispatchHarness);
 INSTANTIATE_TYPED_TEST_SUITE_P(Fake, ClockContract, fakes::ClockHarness);
 INSTANTIATE_TYPED_TEST_SUITE_P(Fake, ProcessContract, fakes::ProcessHarness);
 INSTANTIATE_TYPED_TEST_SUITE_P(Fake, FeatureFlagContract, fakes::FeatureFlags);

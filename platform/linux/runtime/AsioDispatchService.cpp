@@ -7,6 +7,7 @@
 #include "platform/linux/runtime/DispatchPool.h"
 #include "platform/linux/runtime/JobRunner.h"
 #include "platform/linux/runtime/OwnThreadQueue.h"
+#include "platform/linux/runtime/SharedQueue.h"
 
 namespace halvox::platform::linux_ {
 
@@ -24,6 +25,10 @@ std::shared_ptr<DispatchQueue> AsioDispatchService::createSerialQueue(std::strin
     if (auto queue = createOwnThreadQueue(label, quality)) return queue;
   }
   return std::make_shared<SharedQueue>(pool_);
+}
+
+std::shared_ptr<DispatchSemaphore> AsioDispatchService::createSemaphore(std::uint64_t signals) {
+  return std::make_shared<SharedSemaphore>(pool_, signals);
 }
 
 void AsioDispatchService::asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) {

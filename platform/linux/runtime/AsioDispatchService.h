@@ -1,6 +1,7 @@
 #pragma once
 
 #include <chrono>
+#include <cstdint>
 #include <memory>
 #include <string_view>
 #include <vector>
@@ -17,7 +18,8 @@ class JobRunner;
 class OwnThreadQueue;
 
 // Queues over threads of their own and over a small pool (Asio). Nothing runs while nothing is to
-// be done. A job that throws is logged and counted; its queue goes on.
+// be done. A job that throws is logged and counted; its queue goes on. A shared queue that waits on
+// a semaphore costs memory only.
 //
 // Helping: a thread that hands a batch of requests to a queue puts them between beginHelping() and
 // endHelping(). Brief jobs that it adds to a queue with an own thread then wake nobody; at the end
@@ -34,15 +36,16 @@ class AsioDispatchService final : public DispatchService {
 
   std::shared_ptr<DispatchQueue> createSerialQueue(std::string_view label, QualityOfService quality,
                                                    QueueThreading threading) override;
+  std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals) override;
   void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) override;
 
   // From the same thread, in turns. Whoever begins must reach the end soon: the jobs wait for it.
   void beginHelping();
   void endHelping();
 
-  // Ends all threads: the jobs that run end, those that wait and those to come are discarded and
-  // counted. Waits for `limit` at most; false when a job still runs then, and the process should
-  // end without destroying this. May be called again; not from a job.
+  // Ends all threads: the jobs that run end, those that wait, those of waiting queues and those to
+  // come are discarded and counted. Waits for `limit` at most; false when a job still runs then,
+  // and the process should end without destroying this. May be called again; not from a job.
   bool stop(std::chrono::milliseconds limit);
 
  private:

@@ -6,6 +6,7 @@
 #include <filesystem>
 #include <future>
 #include <memory>
+#include <optional>
 #include <stdexcept>
 #include <thread>
 
@@ -241,6 +242,129 @@ TEST_F(AsioDispatchServiceTest, QueuesMayOutliveTheService) {
   own->async(JobWeight::kBrief, [] { FAIL(); });
   shared->async(JobWeight::kBrief, [] { FAIL(); });
   EXPECT_EQ(count("jobs discarded at the stop"), 2U);
+}
+
+class AsioDispatchWaitTest : public AsioDispatchServiceTest {
+ protected:
+  // Lets so many queues of their own wait on the semaphore, and returns when all do.
+  void letQueuesWait(AsioDispatchService& service, int queues,
+                     std::optional<std::chrono::nanoseconds> timeout) {
+    const auto semaphore = semaphore_;
+    for (int number = 0; number < queues; ++number) {
+      const auto queue =
+          service.createSerialQueue("q", QualityOfService::kUtility, QueueThreading::kShared);
+      queue->async(JobWeight::kBrief, [this, queue, semaphore, timeout, held = held_] {
+        queue->waitOn(semaphore, timeout, [this, queue, held](WaitOutcome) { ++ended_; });
+        ++begun_;
+      });
+      queue->async(JobWeight::kBrief, [held = held_] {});
+    }
+    ASSERT_TRUE(waitFor([&] { return begun_ == queues; }));
+  }
+  static std::int64_t wakeUps() {
+    rusage usage{};
+    ::getrusage(RUSAGE_SELF, &usage);
+    return usage.ru_nvcsw + usage.ru_nivcsw;
+  }
+
+  std::shared_ptr<int> held_ = std::make_shared<int>(0);
+  std::atomic<int> begun_{0};
+  std::atomic<int> ended_{0};
+  std::shared_ptr<DispatchSemaphore> semaphore_ = service_->createSemaphore(0);
+};
+
+TEST_F(AsioDispatchWaitTest, ThousandWaitingQueuesCostNoThreadAndNoWakeUps) {
+  const std::size_t before = threadsOfThisProcess();
+  letQueuesWait(*service_, 1000, std::chrono::hours(1));
+  EXPECT_EQ(threadsOfThisProcess(), before);
+
+  ASSERT_TRUE(waitFor([] {
+    const std::int64_t start = wakeUps();
+    std::this_thread::sleep_for(std::chrono::milliseconds(200));
+    return wakeUps() - start <= 2;  // this thread's own
+  }));
+  EXPECT_EQ(ended_, 0);
+}
+
+TEST_F(AsioDispatchWaitTest, StopDropsWaitsWithTheJobsBehindThemAndCountsThem) {
+  for (const auto timeout : {std::optional<std::chrono::nanoseconds>(), {std::chrono::hours(1)}}) {
+    AsioDispatchService service(*log_, statistics_);
+    const std::uint64_t before = count("jobs discarded at the stop");
+    begun_ = 0;
+    held_ = std::make_shared<int>(0);
+    const std::weak_ptr<int> watched = held_;
+    semaphore_ = service.createSemaphore(0);
+    letQueuesWait(service, 100, timeout);
+    held_.reset();
+
+    const auto start = std::chrono::steady_clock::now();
+    EXPECT_TRUE(service.stop(kTestDeadline));
+
+    EXPECT_LT(std::chrono::steady_clock::now() - start, kTestDeadline / 4);
+    EXPECT_TRUE(watched.expired());
+    EXPECT_EQ(count("jobs discarded at the stop") - before, 200U);
+    semaphore_->signal();
+    EXPECT_EQ(ended_, 0);
+  }
+}
+
+TEST_F(AsioDispatchWaitTest, SemaphoreMayOutliveTheService) {
+  letQueuesWait(*service_, 1, std::nullopt);
+  service_.reset();
+
+  semaphore_->signal();
+
+  EXPECT_EQ(ended_, 0);
+}
+
+TEST_F(AsioDispatchWaitTest, SignalsAndTimeOutsThatMeetEndEachWaitOnce) {
+  constexpr int kRounds = 2000;
+  const auto queue = createQueue(QueueThreading::kShared);
+  std::atomic<int> signalled{0};
+  for (int round = 0; round < kRounds; ++round) {
+    queue->async(JobWeight::kBrief, [&] {
+      queue->waitOn(semaphore_, std::chrono::microseconds(50), [&](WaitOutcome outcome) {
+        if (outcome == WaitOutcome::kSignalled) ++signalled;
+        ++ended_;
+      });
+    });
+  }
+  int sent = 0;
+  while (ended_ < kRounds) {
+    if (sent <= signalled) {
+      semaphore_->signal();
+      ++sent;
+    }
+    std::this_thread::yield();
+  }
+  ASSERT_TRUE(drain(*queue));
+
+  EXPECT_EQ(ended_, kRounds);
+  EXPECT_TRUE(signalled == sent || signalled == sent - 1);
+}
+
+TEST_F(AsioDispatchWaitTest, QueueWithItsOwnThreadRefusesToWait) {
+  const auto queue = createQueue(QueueThreading::kOwnThread);
+
+  queue->async(JobWeight::kBrief,
+               [&] { queue->waitOn(semaphore_, std::nullopt, [](WaitOutcome) { FAIL(); }); });
+  ASSERT_TRUE(drain(*queue));
+
+  EXPECT_EQ(count("jobs that failed"), 1U);
+}
+
+TEST_F(AsioDispatchWaitTest, JobThatWaitsTwiceFailsAndItsFirstWaitGoesOn) {
+  const auto queue = createQueue(QueueThreading::kShared);
+
+  queue->async(JobWeight::kBrief, [&] {
+    queue->waitOn(semaphore_, std::nullopt, [&](WaitOutcome) { ++ended_; });
+    queue->waitOn(semaphore_, std::nullopt, [](WaitOutcome) { FAIL(); });
+  });
+  ASSERT_TRUE(waitFor([&] { return count("jobs that failed") == 1; }));
+  semaphore_->signal();
+  ASSERT_TRUE(drain(*queue));
+
+  EXPECT_EQ(ended_, 1);
 }
 
 }  // namespace

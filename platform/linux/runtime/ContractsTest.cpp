@@ -16,6 +16,7 @@
 
 #include "platform/fake/contracts/ClockContract.h"
 #include "platform/fake/contracts/DispatchContract.h"
+#include "platform/fake/contracts/DispatchWaitContract.h"
 #include "platform/fake/contracts/LogContract.h"
 #include "platform/fake/contracts/ProcessContract.h"
 #include "platform/fake/contracts/StatisticsContract.h"
@@ -124,6 +125,7 @@ class SpdlogHarness {
 }  // namespace adapters
 
 INSTANTIATE_TYPED_TEST_SUITE_P(Asio, DispatchContract, adapters::AsioHarness);
+INSTANTIATE_TYPED_TEST_SUITE_P(Asio, DispatchWaitContract, adapters::AsioHarness);
 INSTANTIATE_TYPED_TEST_SUITE_P(Libc, ClockContract, adapters::LibcClockHarness);
 INSTANTIATE_TYPED_TEST_SUITE_P(Procfs, ProcessContract, adapters::ProcfsHarness);
 INSTANTIATE_TYPED_TEST_SUITE_P(Configured, FeatureFlagContract, adapters::ConfiguredFeatureFlags);

@@ -16,20 +16,31 @@ constexpr std::chrono::nanoseconds kLongestDelay = std::chrono::hours(24 * 3652)
 DelayedJobs::DelayedJobs(asio::io_context& context, JobRunner& runner)
     : context_(context), runner_(runner), timer_(context) {}
 
-void DelayedJobs::add(std::chrono::nanoseconds delay, Job job) {
+DelayedJobs::Ticket DelayedJobs::add(std::chrono::nanoseconds delay, Job job) {
   const Time due = std::chrono::steady_clock::now() +
                    std::clamp(delay, std::chrono::nanoseconds(0), kLongestDelay);
   const MutexLock lock(mutex_);
+  const Ticket ticket{due, added_++};
   if (isStopped_) {
     runner_.countDiscarded(1);
-    return;
+    return ticket;
   }
-  const auto place = jobs_.emplace(due, std::move(job));
-  if (place == jobs_.begin()) arm();
+  jobs_.emplace(ticket, std::move(job));
+  if (!armedFor_.has_value() || due < *armedFor_) arm();
+  return ticket;
+}
+
+void DelayedJobs::cancel(const Ticket& ticket) {
+  Job cancelled;  // goes when the lock is no longer held
+  const MutexLock lock(mutex_);
+  const auto place = jobs_.find(ticket);
+  if (place == jobs_.end()) return;
+  cancelled = std::move(place->second);
+  jobs_.erase(place);
 }
 
 void DelayedJobs::stop() {
-  std::multimap<Time, Job> discarded;
+  std::map<Ticket, Job> discarded;
   {
     const MutexLock lock(mutex_);
     isStopped_ = true;
@@ -41,7 +52,8 @@ void DelayedJobs::stop() {
 
 // Sets the timer to the earliest job, in the place of what it waited for.
 void DelayedJobs::arm() {
-  timer_.expires_at(jobs_.begin()->first);
+  armedFor_ = jobs_.begin()->first.first;
+  timer_.expires_at(*armedFor_);
   timer_.async_wait([this](const asio::error_code& error) {
     if (!error) onTimer();
   });
@@ -49,8 +61,9 @@ void DelayedJobs::arm() {
 
 void DelayedJobs::onTimer() {
   const MutexLock lock(mutex_);
-  const auto end = jobs_.upper_bound(std::chrono::steady_clock::now());
-  while (jobs_.begin() != end) {
+  armedFor_.reset();
+  const Time now = std::chrono::steady_clock::now();
+  while (!jobs_.empty() && jobs_.begin()->first.first <= now) {
     auto node = jobs_.extract(jobs_.begin());
     asio::post(context_, [this, job = std::move(node.mapped())] { runDue(job); });
   }

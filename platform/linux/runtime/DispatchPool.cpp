@@ -3,8 +3,6 @@
 #include <system_error>
 #include <utility>
 
-#include <asio/post.hpp>
-
 #include "platform/linux/runtime/ThreadSetup.h"
 
 namespace halvox::platform::linux_ {
@@ -22,6 +20,7 @@ DispatchPool::~DispatchPool() { end(); }
 
 void DispatchPool::stop() {
   isStopped_.store(true, std::memory_order_relaxed);
+  waits_.stop();
   delayedJobs_.stop();
   context_.stop();
 }
@@ -45,10 +44,11 @@ void DispatchPool::end() {
 }
 
 void DispatchPool::discardJobs() {
-  // Each handler sees the stop and lets its job go without running it.
+  // Each handler sees the stop and lets its jobs go without running them.
   work_.reset();
   context_.restart();
   context_.poll();
+  waits_.discard();
 }
 
 void DispatchPool::run() {
@@ -57,18 +57,6 @@ void DispatchPool::run() {
   const MutexLock lock(mutex_);
   --running_;
   ended_.notifyAll();
-}
-
-SharedQueue::SharedQueue(std::shared_ptr<DispatchPool> pool)
-    : pool_(std::move(pool)), strand_(asio::make_strand(pool_->context())) {}
-
-void SharedQueue::async(JobWeight /*weight*/, Job job) {
-  if (pool_->isStopped()) return pool_->runner().countDiscarded(1);
-  asio::post(strand_, [self = shared_from_this(), job = std::move(job)] {
-    if (self->pool_->isStopped()) return self->pool_->runner().countDiscarded(1);
-    const JobRunner::Scope scope(self.get());
-    self->pool_->runner().run(job);
-  });
 }
 
 }  // namespace halvox::platform::linux_

@@ -1,5 +1,7 @@
 #include "platform/linux/runtime/OwnThreadQueue.h"
 
+#include <stdexcept>
+
 #include <sys/resource.h>
 #include <unistd.h>
 
@@ -56,6 +58,12 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
   }
   if (isNewForHelper) helper.note(shared_from_this());
   if (mustWake) wakeUp_.notifyOne();
+}
+
+void OwnThreadQueue::waitOn(std::shared_ptr<DispatchSemaphore> /*semaphore*/,
+                            std::optional<std::chrono::nanoseconds> /*timeout*/,
+                            std::function<void(WaitOutcome)> /*then*/) {
+  throw std::logic_error("a queue with a thread of its own was to wait");
 }
 
 void OwnThreadQueue::close() {

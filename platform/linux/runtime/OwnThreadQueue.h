@@ -4,7 +4,9 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <thread>
 #include <utility>
@@ -40,6 +42,10 @@ class OwnThreadQueue final : public DispatchQueue,
   ~OwnThreadQueue() override;
 
   void async(JobWeight weight, Job job) override;
+  // Throws std::logic_error, which fails the job: only shared queues wait.
+  void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
+              std::optional<std::chrono::nanoseconds> timeout,
+              std::function<void(WaitOutcome)> then) override;
   [[nodiscard]] bool isCurrent() const override { return JobRunner::isCurrent(this); }
 
   // Lets the thread end once all jobs have run. Nobody adds jobs any more.

@@ -1,0 +1,88 @@
+#include "platform/linux/runtime/SharedQueue.h"
+
+#include <stdexcept>
+#include <utility>
+
+#include <asio/post.hpp>
+
+#include "platform/linux/runtime/DispatchPool.h"
+
+namespace halvox::platform::linux_ {
+
+void SharedQueue::async(JobWeight /*weight*/, Job job) {
+  if (pool_->isStopped()) return pool_->runner().countDiscarded(1);
+  {
+    const MutexLock lock(mutex_);
+    jobs_.push_back(std::move(job));
+    if (hasTurn_ || isWaiting_) return;
+    hasTurn_ = true;
+  }
+  beginTurn();
+}
+
+void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
+                         std::optional<std::chrono::nanoseconds> timeout,
+                         std::function<void(WaitOutcome)> then) {
+  if (!isCurrent()) throw std::logic_error("a wait began outside the jobs of its queue");
+  auto shared = std::dynamic_pointer_cast<SharedSemaphore>(std::move(semaphore));
+  if (shared == nullptr) throw std::logic_error("a semaphore of another service");
+  {
+    const MutexLock lock(mutex_);
+    if (isWaiting_) throw std::logic_error("a job began a second wait");
+    isWaiting_ = true;
+  }
+  pool_->waits().begin(shared_from_this(), std::move(shared), timeout, std::move(then));
+}
+
+void SharedQueue::resume(Job then) {
+  {
+    const MutexLock lock(mutex_);
+    jobs_.push_front(std::move(then));
+    isWaiting_ = false;
+    // The job that began the wait may not have returned yet.
+    if (hasTurn_) return;
+    hasTurn_ = true;
+  }
+  beginTurn();
+}
+
+void SharedQueue::beginTurn() {
+  asio::post(pool_->context(), [self = shared_from_this()] { self->runTurn(); });
+}
+
+void SharedQueue::runTurn() {
+  const JobRunner::Scope scope(this);
+  for (int ran = 0; ran < kJobsPerTurn; ++ran) {
+    if (pool_->isStopped()) return discardJobs();
+    if (!runNext()) return;
+  }
+  beginTurn();
+}
+
+// False when there is nothing to run; the turn has ended then.
+bool SharedQueue::runNext() {
+  Job job;
+  {
+    const MutexLock lock(mutex_);
+    if (isWaiting_ || jobs_.empty()) {
+      hasTurn_ = false;
+      return false;
+    }
+    job = std::move(jobs_.front());
+    jobs_.pop_front();
+  }
+  pool_->runner().run(job);
+  return true;
+}
+
+void SharedQueue::discardJobs() {
+  std::deque<Job> discarded;
+  {
+    const MutexLock lock(mutex_);
+    hasTurn_ = false;
+    discarded.swap(jobs_);
+  }
+  if (!discarded.empty()) pool_->runner().countDiscarded(discarded.size());
+}
+
+}  // namespace halvox::platform::linux_
