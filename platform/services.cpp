@@ -32,13 +32,18 @@ DiagnosticReporterService& diagnosticReporters() { return installed().diagnostic
 DispatchService& dispatch() { return installed().dispatch; }
 FeatureFlagService& featureFlags() { return installed().featureFlags; }
 FileService& files() { return installed().files; }
+IOReportService& ioReport() { return installed().ioReport; }
 KdebugService& kdebug() { return installed().kdebug; }
+KtraceService& ktrace() { return installed().ktrace; }
 LogService& log() { return installed().log; }
 MetricService& metrics() { return installed().metrics; }
 NotifyService& notify() { return installed().notify; }
+PerformanceTraceService& performanceTraces() { return installed().performanceTraces; }
 PowerLogService& powerLog() { return installed().powerLog; }
 PreferenceService& preferences() { return installed().preferences; }
 ProcessService& process() { return installed().process; }
+PropertyListService& propertyLists() { return installed().propertyLists; }
+ResultsFileService& resultsFiles() { return installed().resultsFiles; }
 StatisticsService& statistics() { return installed().statistics; }
 TLMReportingService& tlmReporting() { return installed().tlmReporting; }
 

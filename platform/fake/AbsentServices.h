@@ -5,10 +5,15 @@
 
 #include "platform/diagnostic_reporter.h"
 #include "platform/files.h"
+#include "platform/ioreport.h"
+#include "platform/ktrace.h"
 #include "platform/metrics.h"
 #include "platform/notify.h"
+#include "platform/performance_trace.h"
 #include "platform/power_log.h"
 #include "platform/preferences.h"
+#include "platform/property_list.h"
+#include "platform/results_file.h"
 #include "platform/tlm_reporting.h"
 
 namespace halvox::platform {
@@ -103,6 +108,93 @@ class AbsentTlmReporting final : public TLMReportingService {
   TLMReportingOutcome TLMReportingSendOneMessage(const Dictionary&, const Dictionary&,
                                                  const TLMReportingMessage&) override {
     return {};
+  }
+};
+
+class AbsentIOReport final : public IOReportService {
+ public:
+  Channels IOReportCopyChannelsInGroup(Name, Name, std::optional<IOReportError>&) override {
+    return nullptr;
+  }
+  std::int32_t IOReportGetChannelCount(const Channels&) const override { return 0; }
+  Subscription IOReportCreateSubscription(const Channels&, Channels&,
+                                          std::optional<IOReportError>&) override {
+    return nullptr;
+  }
+  Samples IOReportCreateSamples(const Subscription&, const Channels&,
+                                std::optional<IOReportError>&) override {
+    return nullptr;
+  }
+  Samples IOReportCreateSamplesDelta(const Samples&, const Samples&,
+                                     std::optional<IOReportError>&) override {
+    return nullptr;
+  }
+  void IOReportIterate(const Samples&, const Visitor&) const override {}
+};
+
+class AbsentKtrace final : public KtraceService {
+ public:
+  Session ktrace_session_create() override { return std::make_shared<KtraceSession>(); }
+  void ktrace_set_completion_handler(const Session&, std::function<void()> handler) override {
+    completion_ = std::move(handler);
+  }
+  void ktrace_set_walltimes_enabled(const Session&, bool) override {}
+  int ktrace_events_range(const Session&, std::uint32_t, std::uint32_t, EventHandler) override {
+    return 1;
+  }
+  int ktrace_start(const Session&, std::shared_ptr<DispatchQueue>) override { return 1; }
+  void ktrace_end(const Session&, int) override { completion_(); }
+  void ktrace_session_destroy(const Session&) override {}
+  std::uint64_t ktrace_convert_timestamp_to_nanoseconds(const Session&,
+                                                        std::uint64_t timestamp) const override {
+    return timestamp;
+  }
+
+ private:
+  std::function<void()> completion_;
+};
+
+class AbsentPropertyLists final : public PropertyListService {
+ public:
+  std::string currentDirectory() const override { return "/"; }
+  std::optional<Data> readFile(std::string_view, std::optional<Error>&) const override {
+    return std::nullopt;
+  }
+  std::optional<Value> parse(const std::optional<Data>&, std::optional<Error>&) const override {
+    return std::nullopt;
+  }
+};
+
+class AbsentResultsFiles final : public ResultsFileService {
+ public:
+  Writer sswriter_open(std::string_view, std::string_view, std::uint32_t, std::uint32_t) override {
+    return nullptr;
+  }
+  void sswriter_new_value(Sswriter&, std::string_view, ssunit, double) override {}
+  void sswriter_close(Writer) override {}
+};
+
+class AbsentTraceSession final : public KQTraceSession {
+ public:
+  void setDelegate(std::weak_ptr<KQTraceSessionDelegate> delegate) override {
+    delegate_ = std::move(delegate);
+  }
+  void startKQTrace() override {
+    if (const auto delegate = delegate_.lock()) delegate->kqTraceDidStart(Error{});
+  }
+  void stopKQTrace() override {}
+
+ private:
+  std::weak_ptr<KQTraceSessionDelegate> delegate_;
+};
+
+class AbsentPerformanceTraces final : public PerformanceTraceService {
+ public:
+  std::shared_ptr<KQTraceConfig> configWithTemplate(std::int32_t) override {
+    return std::make_shared<KQTraceConfig>();
+  }
+  std::shared_ptr<KQTraceSession> initWithConfig(std::shared_ptr<KQTraceConfig>) override {
+    return std::make_shared<AbsentTraceSession>();
   }
 };
 

@@ -13,13 +13,18 @@ Services FakePlatform::servicesWith(AnalyticsService& otherAnalytics) {
           .dispatch = dispatch,
           .featureFlags = featureFlags,
           .files = files,
+          .ioReport = ioReport,
           .kdebug = kdebug,
+          .ktrace = ktrace,
           .log = log,
           .metrics = metrics,
           .notify = notify,
+          .performanceTraces = performanceTraces,
           .powerLog = powerLog,
           .preferences = preferences,
           .process = process,
+          .propertyLists = propertyLists,
+          .resultsFiles = resultsFiles,
           .statistics = statistics,
           .tlmReporting = tlmReporting};
 }

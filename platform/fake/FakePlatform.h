@@ -8,13 +8,18 @@
 #include "platform/fake/FakeDiagnosticReporterService.h"
 #include "platform/fake/FakeDispatchService.h"
 #include "platform/fake/FakeFeatureFlagService.h"
+#include "platform/fake/FakeIOReportService.h"
 #include "platform/fake/FakeKdebugService.h"
+#include "platform/fake/FakeKtraceService.h"
 #include "platform/fake/FakeLogService.h"
 #include "platform/fake/FakeMetricService.h"
 #include "platform/fake/FakeNotifyService.h"
+#include "platform/fake/FakePerformanceTraceService.h"
 #include "platform/fake/FakePowerLogService.h"
 #include "platform/fake/FakePreferenceService.h"
 #include "platform/fake/FakeProcessService.h"
+#include "platform/fake/FakePropertyListService.h"
+#include "platform/fake/FakeResultsFileService.h"
 #include "platform/fake/FakeStatisticsService.h"
 #include "platform/fake/FakeTlmReportingService.h"
 #include "platform/fake/Journal.h"
@@ -51,6 +56,11 @@ struct FakePlatform {
   FakePowerLogService powerLog{journal};
   FakePreferenceService preferences;
   FakeTlmReportingService tlmReporting{journal};
+  FakeIOReportService ioReport{journal};
+  FakeKtraceService ktrace{journal};
+  FakePerformanceTraceService performanceTraces{journal};
+  FakePropertyListService propertyLists;
+  FakeResultsFileService resultsFiles{journal};
   FakeDispatchService dispatch{clock};
   FakeConnectionService connections{journal};
 };

@@ -122,6 +122,9 @@ LinuxPlatform::LinuxPlatform(const Configuration& configuration)
       featureFlags_(configuration_.features),
       store_(storeOptions(configuration_), {clock_, statistics_, backpressure_}),
       analytics_(store_, clock_),
+      preferenceReader_(configuration_.preferencesDirectory),
+      notify_(configuration_.notifyDirectory, preferenceReader_, statistics_),
+      preferences_(preferenceReader_, statistics_),
       dispatch_(*log_, statistics_) {}
 
 Services LinuxPlatform::services() {
@@ -133,13 +136,18 @@ Services LinuxPlatform::services() {
           .dispatch = dispatch_,
           .featureFlags = featureFlags_,
           .files = files_,
+          .ioReport = ioReport_,
           .kdebug = *kdebug_,
+          .ktrace = ktrace_,
           .log = *log_,
           .metrics = metrics_,
           .notify = notify_,
+          .performanceTraces = performanceTraces_,
           .powerLog = powerLog_,
           .preferences = preferences_,
           .process = process_,
+          .propertyLists = propertyLists_,
+          .resultsFiles = resultsFiles_,
           .statistics = statistics_,
           .tlmReporting = tlmReporting_};
 }
@@ -156,6 +164,7 @@ std::optional<StartFailure> LinuxPlatform::open() {
 }
 
 bool LinuxPlatform::close() {
+  notify_.stop();  // it adds jobs to queues
   const bool ended = dispatch_.stop(kJobsEndWithin);
   store_.close();
   logStatistics();

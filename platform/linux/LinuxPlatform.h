@@ -16,6 +16,9 @@
 #include "platform/linux/runtime/LttngKdebugService.h"
 #include "platform/linux/runtime/ProcfsProcessService.h"
 #include "platform/linux/runtime/SpdlogLogService.h"
+#include "platform/linux/settings/InotifyNotifyService.h"
+#include "platform/linux/settings/PreferenceReader.h"
+#include "platform/linux/settings/TomlPreferenceService.h"
 #include "platform/linux/store/SqliteAnalyticsService.h"
 #include "platform/linux/store/SqliteStore.h"
 #include "platform/services.h"
@@ -69,10 +72,16 @@ class LinuxPlatform {
   AbsentDiagnosticReporters diagnosticReporters_;
   AbsentFiles files_;
   AbsentMetrics metrics_;
-  AbsentNotify notify_;
+  PreferenceReader preferenceReader_;
+  InotifyNotifyService notify_;
   AbsentPowerLog powerLog_;
-  AbsentPreferences preferences_;
+  TomlPreferenceService preferences_;
   AbsentTlmReporting tlmReporting_;
+  AbsentIOReport ioReport_;
+  AbsentKtrace ktrace_;
+  AbsentPerformanceTraces performanceTraces_;
+  AbsentPropertyLists propertyLists_;
+  AbsentResultsFiles resultsFiles_;
   AsioDispatchService dispatch_;
 };
 

@@ -1,0 +1,52 @@
+#pragma once
+
+#include <memory>
+#include <mutex>
+#include <string>
+#include <vector>
+
+#include "platform/fake/Journal.h"
+#include "platform/results_file.h"
+
+namespace halvox::platform {
+
+// Keeps the results files that were written. Notes opening and closing in the journal. Any thread
+// may call.
+class FakeResultsFileService final : public ResultsFileService {
+ public:
+  struct Measurement {
+    std::string name;
+    ssunit unit;
+    double value;
+    friend bool operator==(const Measurement&, const Measurement&) = default;
+  };
+  struct File {
+    std::string path;
+    std::string productName;
+    std::uint32_t version = 0;
+    std::uint32_t flags = 0;
+    std::vector<Measurement> measurements{};
+    bool isClosed = false;
+  };
+
+  // Does not own the journal, which must outlive it.
+  explicit FakeResultsFileService(Journal& journal) : journal_(journal) {}
+
+  // From now on no file can be opened.
+  void failToOpen();
+  [[nodiscard]] std::vector<File> files() const;
+
+  Writer sswriter_open(std::string_view path, std::string_view productName, std::uint32_t version,
+                       std::uint32_t flags) override;
+  void sswriter_new_value(Sswriter& writer, std::string_view name, ssunit unit,
+                          double value) override;
+  void sswriter_close(Writer writer) override;
+
+ private:
+  Journal& journal_;
+  mutable std::mutex mutex_;
+  bool fails_ = false;
+  std::vector<std::shared_ptr<File>> files_;
+};
+
+}  // namespace halvox::platform

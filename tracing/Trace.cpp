@@ -1,0 +1,24 @@
+#include "tracing/Trace.h"
+
+#include <utility>
+
+namespace halvox {
+
+void Trace::addTraceDataToCollect(std::unique_ptr<TraceInterval> interval) {
+  measurements_.push_back(std::move(interval));
+}
+
+void Trace::processTracepoints(const TraceData::Session& session, const TraceData::Events& events) {
+  for (const auto& measurement : measurements_) measurement->processTracepoints(session, events);
+}
+
+Trace::Results Trace::getResults() {
+  for (const auto& measurement : measurements_) {
+    for (const std::uint64_t value : measurement->getResults()) {
+      results_.emplace(measurement->name(), value);
+    }
+  }
+  return results_;
+}
+
+}  // namespace halvox

@@ -1,0 +1,45 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "platform/ktrace.h"
+
+namespace halvox {
+
+// One measurement of a trace: a name and the values found for it. Owned by its trace; belongs to
+// whoever processes the trace. Values and the count add up over several passes.
+class TraceData {
+ public:
+  using Session = platform::KtraceService::Session;
+  using Events = std::vector<platform::trace_point>;
+
+  explicit TraceData(std::string name) : name_(std::move(name)) {}
+  TraceData(const TraceData&) = delete;
+  TraceData& operator=(const TraceData&) = delete;
+  virtual ~TraceData() = default;
+
+  // Looks for values in the events of one trace, which are in the order of their arrival.
+  virtual void processTracepoints(const Session& session, const Events& events) = 0;
+
+  [[nodiscard]] const std::string& name() const { return name_; }
+  [[nodiscard]] bool hasResults() const { return !results_.empty(); }
+  // In the order in which they were found.
+  [[nodiscard]] std::vector<std::uint64_t> getResults() const { return results_; }
+  // Summed and divided in single precision; without results not a number.
+  [[nodiscard]] float getAverageResult() const;
+  [[nodiscard]] std::uint32_t getNumTimesTraced() const { return count_; }
+
+ protected:
+  void addResult(std::uint64_t value) { results_.push_back(value); }
+  void countOne() { ++count_; }
+
+ private:
+  const std::string name_;
+  std::vector<std::uint64_t> results_;
+  std::uint32_t count_ = 0;
+};
+
+}  // namespace halvox
