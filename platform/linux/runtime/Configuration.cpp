@@ -26,6 +26,7 @@ constexpr std::size_t kLongestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
 constexpr std::size_t kLongestStreamName = 255;  // it becomes the name of a directory
 constexpr NumberRange kDays{1, 36'500};
 constexpr NumberRange kMegabytes{1, 1U << 20U};
+constexpr NumberRange kReplicas{1, 5};  // what JetStream takes
 constexpr NumberRange kSessions{1, 1'000'000'000};
 constexpr NumberRange kSnapshots{1, 10'000};
 
@@ -151,6 +152,7 @@ void readLink(TableReader table, Configuration::Link& link) {
   table.readText("subject", isSubject, "names between dots, without blanks, * and >", link.subject);
   table.readText("stream", isStreamName, "a name without blanks, dots, *, >, / and \\",
                  link.stream);
+  table.read("replicas", kReplicas, link.replicas);
   readLinkTls(table.table("tls"), link.tls);
   table.read("credentials", link.credentials, kLongestPath);
   table.finish();
@@ -185,16 +187,22 @@ void readFeatures(TableReader table, FeatureSwitches& features) {
   for (auto& [domain, switches] : table.readTables()) features[domain] = switches.readSwitches();
 }
 
+void readDirectory(TableReader table, std::filesystem::path& directory) {
+  table.read("directory", directory, kLongestPath);
+  table.finish();
+}
+
+// What is below the storage directory unless it is put elsewhere.
+void setDefaultDirectories(Configuration& configuration) {
+  configuration.preferencesDirectory = configuration.storage.directory / "preferences";
+  configuration.notifyDirectory = configuration.storage.directory / "notify";
+}
+
 // Tables that are valid in a file but that nothing reads yet: only their types are checked.
 void checkOtherTables(TableReader& root) {
   std::filesystem::path path;
   bool flag = false;
 
-  for (const std::string_view name : {"preferences", "notify"}) {
-    TableReader table = root.table(name);
-    table.read("directory", path, kLongestPath);
-    table.finish();
-  }
   TableReader drivers = root.table("drivers");
   drivers.read("alsa", flag);
   drivers.read("alsa_root", path, kLongestPath);
@@ -217,6 +225,9 @@ std::variant<Configuration, ConfigurationError> parse(const std::string& file,
   TableReader root(&parsed.table(), "", mistakes);
   readListener(root.table("listener"), configuration.listener);
   readStorage(root.table("storage"), configuration.storage);
+  setDefaultDirectories(configuration);
+  readDirectory(root.table("preferences"), configuration.preferencesDirectory);
+  readDirectory(root.table("notify"), configuration.notifyDirectory);
   readAnalytics(root.table("analytics"), configuration.analytics);
   readLink(root.table("link"), configuration.link);
   readLimits(root.table("limits"), configuration.limits);
@@ -246,6 +257,7 @@ Configuration defaultConfiguration() {
   configuration.listener.socket = defaultSocketPath();
   configuration.storage.directory = defaultStorageDirectory();
   configuration.storage.root = configuration.storage.directory / "root";
+  setDefaultDirectories(configuration);
   return configuration;
 }
 

@@ -52,6 +52,7 @@ struct Configuration {
     std::vector<std::string> servers{"nats://127.0.0.1:4222"};  // at least one
     std::string subject = "halvox";                             // what all subjects begin with
     std::string stream = "HALVOX";
+    std::uint64_t replicas = 1;         // of the stream, when the service makes it
     std::optional<Tls> tls;             // none: as the servers' URLs say
     std::filesystem::path credentials;  // a NATS credentials file; empty: none
   };
@@ -65,6 +66,8 @@ struct Configuration {
   Analytics analytics;
   Link link;
   Limits limits;
+  std::filesystem::path preferencesDirectory;  // [preferences]: <directory>/<user>/<domain>.toml
+  std::filesystem::path notifyDirectory;       // [notify]: files that post by their names
   LogLevel logLevel = LogLevel::kDefault;
   // The least level of the lines that stay in memory for captures of diagnostics.
   LogLevel logMemoryLevel = LogLevel::kInfo;

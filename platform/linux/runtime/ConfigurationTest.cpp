@@ -88,6 +88,8 @@ TEST_F(ConfigurationTest, MissingFileMeansDefaults) {
   EXPECT_EQ(configuration.listener.socket, "/run/halvox/reporting.sock");
   EXPECT_EQ(configuration.storage.directory, directory_ / ".local/state/halvox");
   EXPECT_EQ(configuration.storage.root, directory_ / ".local/state/halvox/root");
+  EXPECT_EQ(configuration.preferencesDirectory, directory_ / ".local/state/halvox/preferences");
+  EXPECT_EQ(configuration.notifyDirectory, directory_ / ".local/state/halvox/notify");
   EXPECT_EQ(configuration.logLevel, LogLevel::kDefault);
   EXPECT_EQ(configuration.analytics.wanted, std::vector<std::string>{"*"});
 }
@@ -250,12 +252,19 @@ TEST_F(ConfigurationTest, EmptyTlsTableMeansTlsWithTheSystemsAuthorities) {
   EXPECT_TRUE(link.tls->verify);
 }
 
+TEST_F(ConfigurationTest, SettingsThatFollowAreBelowTheStorageDirectoryUnlessPutElsewhere) {
+  const Configuration usual = loaded("[storage]\ndirectory = \"/s\"");
+  EXPECT_EQ(usual.preferencesDirectory, "/s/preferences");
+  EXPECT_EQ(usual.notifyDirectory, "/s/notify");
+
+  const Configuration moved =
+      loaded("[preferences]\ndirectory = \"/p\"\n[notify]\ndirectory = \"/n\"");
+  EXPECT_EQ(moved.preferencesDirectory, "/p");
+  EXPECT_EQ(moved.notifyDirectory, "/n");
+}
+
 TEST_F(ConfigurationTest, KeysOfOtherPiecesAreKnown) {
   loaded(R"(
-[preferences]
-directory = "/p"
-[notify]
-directory = "/n"
 [drivers]
 alsa = true
 alsa_root = "/"

@@ -1,0 +1,113 @@
+#include "platform/linux/settings/DirectoryWatch.h"
+
+#include <cerrno>
+#include <utility>
+
+#include <sys/inotify.h>
+#include <unistd.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// A directory that is in its place goes out of it.
+constexpr std::uint32_t kLeaving = IN_MOVE_SELF | IN_DELETE_SELF;
+constexpr std::uint32_t kAppearing = IN_CREATE | IN_MOVED_TO;
+constexpr std::uint32_t kVanishing = IN_MOVED_FROM | IN_DELETE;
+constexpr std::uint32_t kChanging = IN_CLOSE_WRITE | IN_ATTRIB | kAppearing | kVanishing;
+constexpr std::uint32_t kGone = kLeaving | IN_IGNORED | IN_UNMOUNT | IN_Q_OVERFLOW;
+
+bool isMissing(std::error_code error) {
+  return error == std::errc::no_such_file_or_directory || error == std::errc::not_a_directory;
+}
+
+std::error_code lastError() { return {errno, std::generic_category()}; }
+
+// "/a//b/" is "/a/b".
+std::vector<std::filesystem::path> normal(std::vector<std::filesystem::path> paths) {
+  for (auto& path : paths) {
+    path = path.lexically_normal();
+    if (!path.has_filename() && path.has_relative_path()) path = path.parent_path();
+  }
+  return paths;
+}
+
+}  // namespace
+
+DirectoryWatch::DirectoryWatch(std::vector<std::filesystem::path> directories)
+    : directories_(normal(std::move(directories))) {}
+
+std::error_code DirectoryWatch::arm() {
+  watches_.clear();
+  inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
+  if (!inotify_) return lastError();
+  std::error_code first;
+  for (std::size_t place = 0; place < directories_.size(); ++place) {
+    const std::error_code error = watchWay(place);
+    if (!first) first = error;
+  }
+  return first;
+}
+
+// Several watches of one directory are one to the kernel, so what is wanted is added up.
+std::error_code DirectoryWatch::add(const std::filesystem::path& path, std::uint32_t events,
+                                    Watch*& watch) {
+  const int descriptor =
+      ::inotify_add_watch(inotify_.get(), path.c_str(), events | IN_ONLYDIR | IN_MASK_ADD);
+  if (descriptor < 0) return lastError();
+  watch = &watches_[descriptor];
+  return {};
+}
+
+// Watches every directory from the root to the one that is wanted, those on the way only for being
+// moved or deleted. Where the way ends, the next name on it is awaited.
+std::error_code DirectoryWatch::watchWay(std::size_t directory) {
+  const std::filesystem::path& target = directories_[directory];
+  std::filesystem::path path;
+  std::filesystem::path parent;
+  for (const auto& part : target) {
+    path /= part;
+    const bool isTarget = path == target;
+    Watch* watch = nullptr;
+    std::error_code error = add(path, isTarget ? kChanging | kLeaving : kLeaving, watch);
+    if (isMissing(error) && !parent.empty()) {
+      Watch* last = nullptr;
+      if (const auto refused = add(parent, kAppearing, last)) return refused;
+      last->awaited.insert(part.native());
+      // It may have appeared before it was awaited.
+      error = add(path, isTarget ? kChanging | kLeaving : kLeaving, watch);
+      if (isMissing(error)) return {};
+    }
+    // One on the way that may be passed but not read is not watched, and taken to stay.
+    if (error == std::errc::permission_denied && !isTarget) error.clear();
+    if (error) return error;
+    if (isTarget) watch->directories.push_back(directory);
+    parent = path;
+  }
+  return {};
+}
+
+DirectoryWatch::State DirectoryWatch::read(const OnChange& onChange) {
+  State state = State::kArmed;
+  alignas(inotify_event) char buffer[16'384];
+  for (;;) {
+    const ssize_t size = ::read(inotify_.get(), buffer, sizeof buffer);
+    if (size < 0 && errno == EINTR) continue;
+    if (size <= 0) return state;
+    for (const char* next = buffer; next < buffer + size;) {
+      const auto* event = reinterpret_cast<const inotify_event*>(next);
+      next += sizeof(inotify_event) + event->len;
+      if ((event->mask & kGone) != 0) state = State::kMustBeArmedAgain;
+      const auto watch = watches_.find(event->wd);
+      if (watch == watches_.end() || event->len == 0) continue;
+      const std::string_view file(event->name);
+      if (watch->second.awaited.contains(file)) state = State::kMustBeArmedAgain;
+      const Change change =
+          (event->mask & kVanishing) != 0 ? Change::kFileGone : Change::kFileChanged;
+      for (const std::size_t directory : watch->second.directories) {
+        onChange(directory, file, change);
+      }
+    }
+  }
+}
+
+}  // namespace halvox::platform::linux_

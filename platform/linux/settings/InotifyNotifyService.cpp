@@ -1,0 +1,187 @@
+#include "platform/linux/settings/InotifyNotifyService.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstdint>
+#include <system_error>
+#include <utility>
+
+#include <poll.h>
+#include <sys/eventfd.h>
+#include <unistd.h>
+
+#include "platform/linux/runtime/ThreadSetup.h"
+#include "platform/linux/settings/PreferenceFile.h"
+#include "platform/linux/settings/SettingNames.h"
+#include "platform/linux/settings/SettingsLog.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr UnitLog kLog(settingsCategory, "InotifyNotifyService");
+
+// Changes are posted when it has been quiet for so long, or so long after the first of them.
+constexpr auto kQuietTime = 50ms;
+constexpr auto kLongestDelay = 300ms;
+constexpr auto kRetryTime = 5s;
+
+// The directories that are watched, in order.
+constexpr std::size_t kNotifyDirectory = 0;
+
+int pollTimeout(std::optional<std::chrono::steady_clock::time_point> until) {
+  if (!until.has_value()) return -1;
+  const auto left =
+      std::chrono::ceil<std::chrono::milliseconds>(*until - std::chrono::steady_clock::now());
+  return static_cast<int>(std::max<std::int64_t>(left.count(), 0));
+}
+
+void drain(int descriptor) {
+  std::uint64_t count = 0;
+  (void)!::read(descriptor, &count, sizeof count);
+}
+
+}  // namespace
+
+InotifyNotifyService::InotifyNotifyService(std::filesystem::path directory,
+                                           const PreferenceReader& preferences,
+                                           StatisticsService& statistics)
+    : watch_({directory, preferences.directory() / kPreferenceUser}),
+      settings_(directory, preferences, statistics),
+      delivered_(statistics.counter("notifications", "handlers called")) {}
+
+NotifyStatus InotifyNotifyService::notify_register_dispatch(std::string_view name,
+                                                            NotifyToken& token,
+                                                            std::shared_ptr<DispatchQueue> queue,
+                                                            Handler handler) {
+  if (!isUsableName(name)) {
+    kLog.error("refused the notification ", shownName(name), ": it cannot be a file's name");
+    return kNotifyInvalidName;
+  }
+  // Seen before anything can be missed: what changes from here on is found by comparison.
+  SettingBaseline baseline = settings_.look(std::string(name));
+  const MutexLock held(mutex_);
+  if (isStopping_ || !ensureRunning()) return kNotifyFailed;
+  token = ++lastToken_;
+  waiting_.push_back({std::string(name), token, std::move(queue),
+                      std::make_shared<const Handler>(std::move(handler)), std::move(baseline)});
+  (void)::eventfd_write(wake_.get(), 1);
+  return 0;
+}
+
+bool InotifyNotifyService::ensureRunning() {
+  if (thread_.joinable()) return true;
+  wake_.reset(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
+  if (!wake_) return false;
+  try {
+    thread_ = std::thread([this] { run(); });
+  } catch (const std::system_error&) {
+    return false;
+  }
+  return true;
+}
+
+void InotifyNotifyService::stop() {
+  std::thread ending;
+  {
+    const MutexLock held(mutex_);
+    isStopping_ = true;
+    ending.swap(thread_);
+    if (wake_) (void)::eventfd_write(wake_.get(), 1);
+  }
+  if (ending.joinable()) ending.join();
+}
+
+void InotifyNotifyService::run() {
+  setUpThread("halvox.notify");
+  int wake = -1;
+  {
+    const MutexLock held(mutex_);
+    wake = wake_.get();
+  }
+  arm();
+  while (adoptRegistrations()) {
+    std::array<pollfd, 2> polled{{{wake, POLLIN, 0}, {watch_.descriptor(), POLLIN, 0}}};
+    if (::poll(polled.data(), polled.size(), pollTimeout(nextWork())) < 0) continue;
+    if (polled[0].revents != 0) drain(wake);
+    if (polled[1].revents != 0) readChanges();
+    if (retryAt_.has_value() && Clock::now() >= *retryAt_) arm();
+    deliver();
+  }
+}
+
+// False when the thread is to end.
+bool InotifyNotifyService::adoptRegistrations() {
+  std::vector<Registration> adopted;
+  {
+    const MutexLock held(mutex_);
+    if (isStopping_) return false;
+    adopted.swap(waiting_);
+  }
+  for (Registration& one : adopted) {
+    settings_.add(one.name, std::exchange(one.baseline, {}));
+    registrations_.push_back(std::move(one));
+    noteNews();
+  }
+  return true;
+}
+
+void InotifyNotifyService::arm() {
+  const bool wasFailing = retryAt_.has_value();
+  const std::error_code error = watch_.arm();
+  retryAt_.reset();
+  if (error) {
+    retryAt_ = Clock::now() + kRetryTime;
+    if (!wasFailing) {
+      kLog.error("changed settings go unnoticed: their directories cannot be watched: ",
+                 error.message());
+    }
+  } else if (wasFailing) {
+    kLog.notice("changed settings are noticed again");
+  }
+  settings_.noteEverything();
+  noteNews();
+}
+
+void InotifyNotifyService::readChanges() {
+  const auto state = watch_.read(
+      [this](std::size_t directory, std::string_view file, DirectoryWatch::Change change) {
+        if (directory != kNotifyDirectory) {
+          settings_.notePreferenceFile(file);
+        } else if (change == DirectoryWatch::Change::kFileChanged) {
+          settings_.noteNotifyFile(file);
+        }
+        noteNews();
+      });
+  if (state == DirectoryWatch::State::kMustBeArmedAgain) arm();
+}
+
+void InotifyNotifyService::noteNews() {
+  if (!settings_.hasNews()) return;
+  lastNews_ = Clock::now();
+  if (!firstNews_.has_value()) firstNews_ = lastNews_;
+}
+
+std::optional<InotifyNotifyService::Clock::time_point> InotifyNotifyService::nextWork() const {
+  if (!firstNews_.has_value()) return retryAt_;
+  const auto due = std::min(lastNews_ + kQuietTime, *firstNews_ + kLongestDelay);
+  return retryAt_.has_value() ? std::min(due, *retryAt_) : due;
+}
+
+void InotifyNotifyService::deliver() {
+  if (!firstNews_.has_value()) return;
+  if (Clock::now() < std::min(lastNews_ + kQuietTime, *firstNews_ + kLongestDelay)) return;
+  firstNews_.reset();
+  const std::set<std::string> posted = settings_.settle();
+  for (const Registration& one : registrations_) {
+    if (!posted.contains(one.name)) continue;
+    kLog.debug("posting ", one.name);
+    delivered_.add();
+    one.queue->async(JobWeight::kMayBlock,
+                     [handler = one.handler, token = one.token] { (*handler)(token); });
+  }
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,306 @@
+#include "platform/linux/settings/InotifyNotifyService.h"
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <sys/stat.h>
+
+#include "platform/linux/settings/SettingsTestSupport.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr const char* kName = "org.example.changed";
+constexpr const char* kDomain = "org.example";
+// A name of which each test can see that all before it has been looked at.
+constexpr const char* kSentinel = "sentinel";
+
+class InotifyNotifyServiceTest : public SettingsTest {
+ protected:
+  ~InotifyNotifyServiceTest() override { service_.stop(); }
+
+  NotifyStatus listen(const std::string& name) {
+    NotifyToken token = 0;
+    return service_.notify_register_dispatch(name, token, queue_,
+                                             [this](NotifyToken fired) { ++posts_[fired]; });
+  }
+  int posts(NotifyToken token) {
+    platform_.dispatch.runUntilIdle();
+    return posts_[token];
+  }
+  bool waitForPosts(NotifyToken token, int count) {
+    return waitFor([&] { return posts(token) >= count; });
+  }
+  // Everything that happened before has been looked at once this is back.
+  void waitUntilSettled() {
+    const int before = posts(sentinel_);
+    write(notify() / kSentinel, "");
+    ASSERT_TRUE(waitForPosts(sentinel_, before + 1));
+  }
+  void begin() {
+    ASSERT_EQ(service_.notify_register_dispatch(kSentinel, sentinel_, queue_,
+                                                [this](NotifyToken fired) { ++posts_[fired]; }),
+              0U);
+    ASSERT_EQ(service_.notify_register_dispatch(kName, name_, queue_,
+                                                [this](NotifyToken fired) { ++posts_[fired]; }),
+              0U);
+    waitUntilSettled();
+  }
+  // One way of saving: the posts that it leads to.
+  int postsOf(const std::function<void()>& change) {
+    const int before = posts(name_);
+    change();
+    waitUntilSettled();
+    return posts(name_) - before;
+  }
+
+  std::shared_ptr<DispatchQueue> queue_ = platform_.dispatch.createSerialQueue(
+      "test", QualityOfService::kUtility, QueueThreading::kShared);
+  std::map<NotifyToken, int> posts_;
+  NotifyToken sentinel_ = 0;
+  NotifyToken name_ = 0;
+  PreferenceReader reader_{preferences()};
+  InotifyNotifyService service_{notify(), reader_, platform_.statistics};
+};
+
+TEST_F(InotifyNotifyServiceTest, EveryRegistrationHasATokenOfItsOwn) {
+  begin();
+
+  EXPECT_NE(sentinel_, 0);
+  EXPECT_NE(name_, 0);
+  EXPECT_NE(name_, sentinel_);
+}
+
+TEST_F(InotifyNotifyServiceTest, NamesThatCannotBeFilesAreRefused) {
+  for (const std::string& name : {std::string(), std::string(".."), std::string("a/b"),
+                                  std::string("a\0b", 3), std::string(1000, 'a')}) {
+    NotifyToken token = 77;
+    EXPECT_EQ(service_.notify_register_dispatch(name, token, queue_, [](NotifyToken) {}),
+              kNotifyInvalidName);
+    EXPECT_EQ(token, 77);
+  }
+  EXPECT_EQ(linesWith("refused the notification"), 5U);
+}
+
+TEST_F(InotifyNotifyServiceTest, AFileThatIsMadeTouchedOrWrittenPostsItsName) {
+  begin();
+
+  EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);
+  EXPECT_EQ(postsOf([this] { ::utimensat(AT_FDCWD, (notify() / kName).c_str(), nullptr, 0); }), 1);
+  EXPECT_EQ(postsOf([this] { write(notify() / kName, "anything"); }), 1);
+}
+
+TEST_F(InotifyNotifyServiceTest, AFileThatIsMovedIntoTheDirectoryPostsItsName) {
+  begin();
+  write(scratch_ / "elsewhere", "");
+
+  EXPECT_EQ(postsOf([this] { std::filesystem::rename(scratch_ / "elsewhere", notify() / kName); }),
+            1);
+}
+
+TEST_F(InotifyNotifyServiceTest, AFileThatIsMadeAndDeletedAtOncePostsItsName) {
+  begin();
+
+  EXPECT_EQ(postsOf([this] {
+              write(notify() / kName, "");
+              std::filesystem::remove(notify() / kName);
+            }),
+            1);
+  write(notify() / kName, "");
+  waitUntilSettled();
+  EXPECT_EQ(postsOf([this] { std::filesystem::remove(notify() / kName); }), 0);
+}
+
+TEST_F(InotifyNotifyServiceTest, OtherFilesPostNothing) {
+  begin();
+
+  EXPECT_EQ(postsOf([this] {
+              write(notify() / (std::string(kName) + "x"), "");
+              write(preferences() / "mobile" / "org.example2.toml", "a = 1");
+              write(preferences() / "root" / "org.example.toml", "a = 1");
+              write(preferences() / "mobile" / "org.example.toml~", "a = 1");
+            }),
+            0);
+}
+
+TEST_F(InotifyNotifyServiceTest, APostCallsEveryHandlerOfThatNameWithItsToken) {
+  begin();
+  NotifyToken second = 0;
+  ASSERT_EQ(service_.notify_register_dispatch(kName, second, queue_,
+                                              [this](NotifyToken fired) { ++posts_[fired]; }),
+            0U);
+
+  EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);
+  EXPECT_EQ(posts(second), 1);
+  EXPECT_NE(second, name_);
+}
+
+TEST_F(InotifyNotifyServiceTest, WhatIsThereAtTheRegistrationPostsNothing) {
+  write(notify() / kName, "");
+  write(domainFile(kDomain), "a = 1");
+
+  begin();
+
+  EXPECT_EQ(posts(name_), 0);
+}
+
+TEST_F(InotifyNotifyServiceTest, AChangedPreferenceFilePostsTheNamesOfItsDomain) {
+  begin();
+  const auto domainsOfName = {"org", "org.example", "org.example.changed"};
+  for (const std::string domain : domainsOfName) {
+    EXPECT_EQ(postsOf([&] { write(domainFile(domain), "a = 1"); }), 1) << domain;
+  }
+}
+
+TEST_F(InotifyNotifyServiceTest, EveryWayOfSavingIsOnePost) {
+  begin();
+  const auto file = domainFile(kDomain);
+  const auto other = preferences() / "mobile" / ".org.example.toml.swp";
+
+  EXPECT_EQ(postsOf([&] { write(file, "a = 1"); }), 1) << "made";
+  EXPECT_EQ(postsOf([&] { write(file, "a = 2"); }), 1) << "truncated and written";
+  EXPECT_EQ(postsOf([&] {
+              write(file, "");
+              write(file, "a = 3");
+            }),
+            1)
+      << "truncated, then written";
+  EXPECT_EQ(postsOf([&] {
+              write(other, "a = 4");
+              std::filesystem::rename(other, file);
+            }),
+            1)
+      << "renamed over";
+  EXPECT_EQ(postsOf([&] {
+              std::filesystem::rename(file, other);
+              write(file, "a = 5");
+              std::filesystem::remove(other);
+            }),
+            1)
+      << "moved away as a backup and written anew";
+  EXPECT_EQ(postsOf([&] { std::filesystem::remove(file); }), 1) << "removed";
+}
+
+TEST_F(InotifyNotifyServiceTest, ASaveThatChangesNoValuePostsNothing) {
+  begin();
+  write(domainFile(kDomain), "a = 1\n");
+  ASSERT_TRUE(waitForPosts(name_, 1));
+
+  EXPECT_EQ(postsOf([this] { write(domainFile(kDomain), "a = 1\n"); }), 0);
+  EXPECT_EQ(postsOf([this] { write(domainFile(kDomain), "# note\na  =  1\n"); }), 0);
+}
+
+TEST_F(InotifyNotifyServiceTest, ABrokenFilePostsNothingUntilItIsMendedWithOtherValues) {
+  begin();
+  write(domainFile(kDomain), "a = 1");
+  ASSERT_TRUE(waitForPosts(name_, 1));
+
+  EXPECT_EQ(postsOf([this] { write(domainFile(kDomain), "a = "); }), 0);
+  EXPECT_EQ(linesWith("org.example.toml:1:"), 1U);
+  EXPECT_EQ(postsOf([this] { write(domainFile(kDomain), "a = 1"); }), 0);
+  EXPECT_EQ(postsOf([this] { write(domainFile(kDomain), "a = "); }), 0);
+  EXPECT_EQ(postsOf([this] { write(domainFile(kDomain), "a = 2"); }), 1);
+}
+
+TEST_F(InotifyNotifyServiceTest, APipeInThePlaceOfAFileHoldsNothingUp) {
+  begin();
+
+  EXPECT_EQ(postsOf([this] {
+              std::filesystem::create_directories(preferences() / "mobile");
+              ASSERT_EQ(::mkfifo(domainFile(kDomain).c_str(), 0600), 0);
+            }),
+            0);
+  EXPECT_EQ(linesWith("expected a regular file"), 1U);
+}
+
+TEST_F(InotifyNotifyServiceTest, AFileAndAPreferenceTogetherAreOnePost) {
+  begin();
+
+  EXPECT_EQ(postsOf([this] {
+              write(domainFile(kDomain), "a = 1");
+              write(notify() / kName, "");
+            }),
+            1);
+}
+
+TEST_F(InotifyNotifyServiceTest, ADirectoryThatIsDeletedAndMadeAgainWorksAgain) {
+  begin();
+  for (int turn = 0; turn < 3; ++turn) {
+    EXPECT_EQ(postsOf([this] {
+                std::filesystem::remove_all(notify());
+                write(notify() / kName, "");
+              }),
+              1);
+    EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);
+  }
+}
+
+TEST_F(InotifyNotifyServiceTest, ADirectoryThatIsMovedAwayIsWatchedNoMore) {
+  begin();
+  std::filesystem::rename(notify(), scratch_ / "old");
+  waitUntilSettled();  // in the new one
+
+  EXPECT_EQ(postsOf([this] { write(scratch_ / "old" / kName, ""); }), 0);
+  EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);
+}
+
+TEST_F(InotifyNotifyServiceTest, AllDirectoriesOnTheWayMayGoAndComeBack) {
+  begin();
+  write(domainFile(kDomain), "a = 1");
+  ASSERT_TRUE(waitForPosts(name_, 1));
+
+  std::filesystem::rename(scratch_, scratch_.native() + ".away");
+  std::filesystem::remove_all(scratch_.native() + ".away");
+  write(domainFile(kDomain), "a = 2");
+  ASSERT_TRUE(waitForPosts(name_, 2));
+
+  EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);
+}
+
+TEST_F(InotifyNotifyServiceTest, NoPreferenceIsMissedInAFloodOfEvents) {
+  begin();
+  std::filesystem::create_directories(preferences() / "mobile");
+
+  // Far more than the kernel keeps for a reader that is behind.
+  for (int turn = 0; turn < 20'000; ++turn) {
+    const auto other = preferences() / "mobile" / ("x" + std::to_string(turn % 7));
+    ::close(::open(other.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600));
+  }
+  write(domainFile(kDomain), "a = 1");
+
+  EXPECT_TRUE(waitForPosts(name_, 1));
+}
+
+TEST_F(InotifyNotifyServiceTest, SteadyChangesAreNotPutOffForEver) {
+  begin();
+  int number = 0;
+
+  EXPECT_TRUE(waitFor([&] {
+    write(domainFile(kDomain), "a = " + std::to_string(++number));
+    return posts(name_) >= 3;
+  }));
+}
+
+TEST_F(InotifyNotifyServiceTest, AfterTheStopRegistrationsFail) {
+  begin();
+  service_.stop();
+  service_.stop();
+
+  EXPECT_EQ(listen("another"), kNotifyFailed);
+}
+
+TEST_F(InotifyNotifyServiceTest, EverythingNoticedIsAccountedFor) {
+  begin();
+  EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);
+  EXPECT_EQ(postsOf([this] { write(domainFile(kDomain), "a = "); }), 0);
+  EXPECT_EQ(postsOf([this] { write(domainFile(kDomain), "a = 1"); }), 1);
+  service_.stop();
+
+  auto counted = platform_.statistics.values("notifications");
+  EXPECT_GE(counted["suppressed: preferences not readable"], 1U);
+  EXPECT_EQ(counted["noticed"], counted["posted"] + counted["suppressed: nothing new"] +
+                                    counted["suppressed: preferences not readable"] +
+                                    counted["merged with another"]);
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

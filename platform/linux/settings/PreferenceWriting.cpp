@@ -1,0 +1,103 @@
+#include "platform/linux/settings/PreferenceWriting.h"
+
+#include <cerrno>
+#include <cstdlib>
+#include <system_error>
+#include <utility>
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "platform/linux/UniqueHandle.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// For others to read, as far as the process's mask allows.
+constexpr mode_t kModeOfNewFiles = 0644;
+
+PreferenceFileError failure(const std::filesystem::path& path, int error) {
+  return {path.native() + ": " + std::system_category().message(error)};
+}
+
+// A file that is not named yet; it goes when it is not kept.
+class NewFile {
+ public:
+  explicit NewFile(const std::filesystem::path& target)
+      : path_((target.parent_path() / ("." + target.filename().native() + ".XXXXXX")).native()),
+        descriptor_(::mkostemp(path_.data(), O_CLOEXEC)) {}
+  NewFile(const NewFile&) = delete;
+  NewFile& operator=(const NewFile&) = delete;
+  ~NewFile() {
+    if (descriptor_ && !isKept_) ::unlink(path_.c_str());
+  }
+
+  [[nodiscard]] bool write(std::string_view text, mode_t mode) {
+    if (!descriptor_ || ::fchmod(descriptor_.get(), mode) != 0) return false;
+    while (!text.empty()) {
+      const ssize_t count = ::write(descriptor_.get(), text.data(), text.size());
+      if (count < 0 && errno == EINTR) continue;
+      if (count < 0) return false;
+      text.remove_prefix(static_cast<std::size_t>(count));
+    }
+    return ::fsync(descriptor_.get()) == 0;
+  }
+  // Takes the place of `target`.
+  [[nodiscard]] bool keepAs(const std::filesystem::path& target) {
+    isKept_ = ::rename(path_.c_str(), target.c_str()) == 0;
+    return isKept_;
+  }
+
+ private:
+  std::string path_;
+  UniqueFd descriptor_;
+  bool isKept_ = false;
+};
+
+mode_t modeOfNewFile() {
+  const mode_t mask = ::umask(0);
+  ::umask(mask);
+  return kModeOfNewFiles & ~mask;
+}
+
+std::optional<PreferenceFileError> replace(const std::filesystem::path& file,
+                                           const std::string& text, mode_t mode, int directory) {
+  NewFile made(file);
+  if (!made.write(text, mode) || !made.keepAs(file)) return failure(file, errno);
+  if (::fsync(directory) != 0) return failure(file.parent_path(), errno);
+  return std::nullopt;
+}
+
+// The file that a link stands for, so that the link stays.
+std::filesystem::path target(const std::filesystem::path& file) {
+  std::error_code ignored;
+  const auto real = std::filesystem::canonical(file, ignored);
+  return ignored ? file : real;
+}
+
+}  // namespace
+
+std::optional<PreferenceFileError> changePreferenceFile(const std::filesystem::path& named,
+                                                        const PreferenceEdit& edit) {
+  const std::filesystem::path file = target(named);
+  const std::filesystem::path directory = file.parent_path();
+  std::error_code error;
+  std::filesystem::create_directories(directory, error);
+  if (error) return failure(directory, error.value());
+  const UniqueFd held(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!held || ::flock(held.get(), LOCK_EX) != 0) return failure(directory, errno);
+
+  auto content = readPreferenceText(file);
+  if (auto* problem = std::get_if<PreferenceFileError>(&content)) return std::move(*problem);
+  const auto& old = std::get<std::optional<PreferenceText>>(content);
+  const std::string before = old.has_value() ? old->text : std::string();
+  auto edited = edit(before, file);
+  if (auto* problem = std::get_if<PreferenceFileError>(&edited)) return std::move(*problem);
+  const std::string& after = std::get<std::string>(edited);
+  if (after == before) return std::nullopt;
+  return replace(file, after, old.has_value() ? old->mode : modeOfNewFile(), held.get());
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,105 @@
+#include "platform/linux/settings/PreferenceWriting.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "platform/linux/settings/SettingsTestSupport.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+class PreferenceWritingTest : public SettingsTest {
+ protected:
+  static PreferenceEdit to(std::string text) {
+    return [text = std::move(text)](std::string_view, const std::filesystem::path&) {
+      return std::variant<std::string, PreferenceFileError>(text);
+    };
+  }
+  std::size_t filesBeside() const {
+    const std::filesystem::directory_iterator all(file_.parent_path());
+    return static_cast<std::size_t>(std::distance(begin(all), end(all)));
+  }
+  static unsigned modeOf(const std::filesystem::path& path) {
+    struct stat status {};
+    ::stat(path.c_str(), &status);
+    return status.st_mode & 07777U;
+  }
+
+  const std::filesystem::path file_ = domainFile("domain");
+};
+
+TEST_F(PreferenceWritingTest, MakesFileAndDirectories) {
+  EXPECT_FALSE(changePreferenceFile(file_, to("a = 1\n")).has_value());
+
+  EXPECT_EQ(read(file_), "a = 1\n");
+  EXPECT_EQ(filesBeside(), 1U);
+}
+
+TEST_F(PreferenceWritingTest, TheEditSeesWhatIsThere) {
+  write(file_, "a = 1\n");
+  std::string seen;
+  const auto edit = [&seen](std::string_view text, const std::filesystem::path&) {
+    seen = text;
+    return std::variant<std::string, PreferenceFileError>(seen + "b = 2\n");
+  };
+
+  EXPECT_FALSE(changePreferenceFile(file_, edit).has_value());
+
+  EXPECT_EQ(seen, "a = 1\n");
+  EXPECT_EQ(read(file_), "a = 1\nb = 2\n");
+}
+
+TEST_F(PreferenceWritingTest, KeepsThePermissions) {
+  write(file_, "a = 1\n");
+  ::chmod(file_.c_str(), 0640);
+
+  EXPECT_FALSE(changePreferenceFile(file_, to("a = 2\n")).has_value());
+
+  EXPECT_EQ(modeOf(file_), 0640U);
+}
+
+TEST_F(PreferenceWritingTest, ALinkStaysALink) {
+  write(scratch_ / "real.toml", "a = 1\n");
+  std::filesystem::create_directories(file_.parent_path());
+  std::filesystem::create_symlink(scratch_ / "real.toml", file_);
+
+  EXPECT_FALSE(changePreferenceFile(file_, to("a = 2\n")).has_value());
+
+  EXPECT_TRUE(std::filesystem::is_symlink(file_));
+  EXPECT_EQ(read(scratch_ / "real.toml"), "a = 2\n");
+}
+
+TEST_F(PreferenceWritingTest, ARefusedEditLeavesTheFileAlone) {
+  write(file_, "a = 1\n");
+
+  const auto error = changePreferenceFile(file_, [](auto, const auto&) {
+    return std::variant<std::string, PreferenceFileError>(PreferenceFileError{"no"});
+  });
+
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->description, "no");
+  EXPECT_EQ(read(file_), "a = 1\n");
+  EXPECT_EQ(filesBeside(), 1U);
+}
+
+TEST_F(PreferenceWritingTest, ADirectoryThatCannotBeMadeIsNamed) {
+  write(preferences(), "a file");
+
+  const auto error = changePreferenceFile(file_, to("a = 1\n"));
+
+  ASSERT_TRUE(error.has_value());
+  EXPECT_NE(error->description.find(file_.parent_path().native()), std::string::npos);
+}
+
+TEST_F(PreferenceWritingTest, WhatIsNoRegularFileIsLeftAlone) {
+  std::filesystem::create_directories(file_.parent_path());
+  ASSERT_EQ(::mkfifo(file_.c_str(), 0600), 0);
+
+  const auto error = changePreferenceFile(file_, to("a = 1\n"));
+
+  ASSERT_TRUE(error.has_value());
+  EXPECT_TRUE(std::filesystem::is_fifo(file_));
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,13 @@
+#pragma once
+
+#include "platform/log.h"
+#include "platform/services.h"
+
+namespace halvox::platform::linux_ {
+
+inline LogCategory& settingsCategory() {
+  static LogCategory& category = platform::log().createCategory("com.tarno.halvox", "settings");
+  return category;
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,61 @@
+#pragma once
+
+#include <chrono>
+#include <filesystem>
+#include <fstream>
+#include <functional>
+#include <string>
+#include <string_view>
+#include <thread>
+
+#include <gtest/gtest.h>
+#include <stdlib.h>
+
+#include "platform/fake/FakePlatform.h"
+
+namespace halvox::platform::linux_ {
+
+// Directories of preferences and of notifications that a test may do with what it likes; neither is
+// there at first.
+class SettingsTest : public testing::Test {
+ protected:
+  SettingsTest() {
+    std::string pattern = (std::filesystem::temp_directory_path() / "halvox-settings-XXXXXX");
+    scratch_ = ::mkdtemp(pattern.data());
+  }
+  ~SettingsTest() override { std::filesystem::remove_all(scratch_); }
+
+  [[nodiscard]] std::filesystem::path preferences() const { return scratch_ / "preferences"; }
+  [[nodiscard]] std::filesystem::path notify() const { return scratch_ / "notify"; }
+  [[nodiscard]] std::filesystem::path domainFile(const std::string& domain) const {
+    return preferences() / "mobile" / (domain + ".toml");
+  }
+  static void write(const std::filesystem::path& file, std::string_view text) {
+    std::filesystem::create_directories(file.parent_path());
+    std::ofstream(file, std::ios::binary | std::ios::trunc) << text;
+  }
+  static std::string read(const std::filesystem::path& file) {
+    std::ifstream stream(file, std::ios::binary);
+    return {std::istreambuf_iterator<char>(stream), {}};
+  }
+  // Looks again and again until the condition holds; false when it does not in time.
+  static bool waitFor(const std::function<bool()>& condition) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    while (!condition()) {
+      if (std::chrono::steady_clock::now() > deadline) return false;
+      std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    }
+    return true;
+  }
+  // How many log lines have that text in them.
+  [[nodiscard]] std::size_t linesWith(std::string_view text) const {
+    std::size_t count = 0;
+    for (const auto& line : platform_.log.texts()) count += line.find(text) != std::string::npos;
+    return count;
+  }
+
+  FakePlatform platform_;
+  std::filesystem::path scratch_;
+};
+
+}  // namespace halvox::platform::linux_
