@@ -1,0 +1,199 @@
+#include "platform/linux/link/nats/NatsLink.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "platform/linux/link/nats/NatsLog.h"
+#include "platform/linux/runtime/ThreadSetup.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog(natsLogCategory, "NatsLink.cpp");
+constexpr std::chrono::milliseconds kLibraryEndTime{2000};
+constexpr std::string_view kErrorDomain = "com.tarno.halvox.link";
+
+}  // namespace
+
+NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environment)
+    : options_(std::move(options)),
+      dispatch_(environment.dispatch),
+      statistics_(environment.statistics),
+      received_(statistics_.counter(kNatsPiece, "received")),
+      acknowledged_(statistics_.counter(kNatsPiece, "acknowledged")),
+      notAcknowledged_(statistics_.counter(kNatsPiece, "not acknowledged")) {}
+
+NatsLink::~NatsLink() { close(); }
+
+void NatsLink::discover(TLMReportingService::BackendsCallback found) {
+  std::optional<Array> servers;
+  std::uint64_t waiter = 0;
+  bool isRefused = false;
+  {
+    const MutexLock lock(mutex_);
+    isRefused = closeBy_.has_value();
+    if (!isRefused && isConnected_) {
+      servers = servers_;
+    } else if (!isRefused) {
+      waiter = ++lastWaiter_;
+      waiters_.push_back({waiter, std::move(found)});
+      wakeThread();
+    }
+  }
+  if (waiter == 0) return found(servers);
+  dispatch_.asyncAfterOnBackgroundQueue(kDiscoveryTime, [link = weak_from_this(), waiter] {
+    if (const auto self = link.lock()) self->expire(waiter);
+  });
+}
+
+void NatsLink::expire(std::uint64_t waiter) {
+  TLMReportingService::BackendsCallback found;
+  {
+    const MutexLock lock(mutex_);
+    const auto place = std::ranges::find(waiters_, waiter, &Waiter::id);
+    if (place == waiters_.end()) return;
+    found = std::move(place->found);
+    waiters_.erase(place);
+  }
+  found(std::nullopt);
+}
+
+std::optional<Error> NatsLink::refusal(const OutgoingMessage& message) {
+  const auto refuse = [](std::string description) {
+    return Error{
+        .domain = std::string(kErrorDomain), .code = 1, .description = std::move(description)};
+  };
+  if (closeBy_) return refuse("the service is ending");
+  if (maxPayload_ > 0 && message.bytes > maxPayload_) {
+    return refuse("a message of " + std::to_string(message.bytes) + " bytes is more than the " +
+                  std::to_string(maxPayload_) + " that the server takes");
+  }
+  if (queuedBytes_ + message.bytes > kQueueBytes) {
+    return refuse("no room: " + std::to_string(queue_.size()) + " messages wait for the server");
+  }
+  // Where the last attempt failed a moment ago, the next message need not wait for another.
+  if (!connection_ && !lastFailure_.empty() && std::chrono::steady_clock::now() < nextAttempt_) {
+    return refuse("no server was reached: " + lastFailure_);
+  }
+  return std::nullopt;
+}
+
+std::optional<Error> NatsLink::send(OutgoingMessage message) {
+  received_.add();
+  std::optional<Error> error;
+  {
+    const MutexLock lock(mutex_);
+    error = refusal(message);
+    if (!error) {
+      queuedBytes_ += message.bytes;
+      queue_.push_back(std::move(message));
+      wakeThread();
+      return std::nullopt;
+    }
+  }
+  statistics_.counter(kNatsPiece, "failed: refused").add();
+  if (message.ledger) message.ledger->resolve(message.number, AckOutcome::kRefused);
+  return error;
+}
+
+void NatsLink::close() {
+  {
+    const MutexLock lock(mutex_);
+    if (closeBy_) return;
+    closeBy_ = std::chrono::steady_clock::now() + kCloseTime;
+    changed_.notifyAll();
+  }
+  if (!thread_.joinable()) return;
+  thread_.join();
+  // After this no callback of the library runs; if it does not end, they may still find this here.
+  if (nats_CloseAndWait(kLibraryEndTime.count()) == NATS_OK) return;
+  kLog.error("the client library of the link did not end in time");
+  static auto* const kept = new std::vector<std::shared_ptr<NatsLink>>;  // never destroyed
+  if (auto self = weak_from_this().lock()) kept->push_back(std::move(self));
+}
+
+void NatsLink::wakeThread() {
+  if (!thread_.joinable()) {
+    thread_ = std::thread([this] { run(); });
+  } else if (isIdle_) {
+    isIdle_ = false;
+    changed_.notifyAll();
+  }
+}
+
+NatsLink::Step NatsLink::nextStepClosing(Time now) {
+  if (!connection_ || isLost_ || now >= *closeBy_) return Step::kEnd;
+  if (queue_.empty() && pending_.size() == 0) return Step::kEnd;
+  const bool canSend = !queue_.empty() && !isBufferFull_ && !isWindowFull_;
+  return canSend ? Step::kSend : Step::kWait;
+}
+
+NatsLink::Step NatsLink::nextStep(Time now) {
+  if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
+  if (closeBy_) return nextStepClosing(now);
+  if (isLost_) return Step::kDrop;
+  if (isConnected_ && !waiters_.empty()) return Step::kAnswer;
+  if (!connection_) {
+    const bool isNeeded = !waiters_.empty() || !queue_.empty();
+    return isNeeded && now >= nextAttempt_ ? Step::kConnect : Step::kWait;
+  }
+  return !queue_.empty() && !isBufferFull_ && !isWindowFull_ ? Step::kSend : Step::kWait;
+}
+
+void NatsLink::waitForChange() {
+  isIdle_ = true;
+  if (closeBy_) {
+    changed_.waitUntil(mutex_, *closeBy_);
+  } else if (!connection_ && (!waiters_.empty() || !queue_.empty())) {
+    changed_.waitUntil(mutex_, nextAttempt_);
+  } else {
+    changed_.wait(mutex_);
+  }
+  isIdle_ = false;
+}
+
+void NatsLink::run() {
+  setUpThread("com.tarno.halvox.link");
+  while (true) {
+    Step step = Step::kWait;
+    {
+      const MutexLock lock(mutex_);
+      step = nextStep(std::chrono::steady_clock::now());
+      if (step == Step::kWait) waitForChange();
+    }
+    switch (step) {
+      case Step::kWait:
+        break;
+      case Step::kAnswer:
+        answerWaiters();
+        break;
+      case Step::kConnect:
+        connect();
+        break;
+      case Step::kSend:
+        publishSome();
+        break;
+      case Step::kDrop:
+        dropConnection();
+        break;
+      case Step::kEnd:
+        dropConnection();
+        answerWaiters();
+        nats_ReleaseThreadMemory();
+        return;
+    }
+  }
+}
+
+void NatsLink::answerWaiters() {
+  std::vector<Waiter> waiters;
+  std::optional<Array> servers;
+  {
+    const MutexLock lock(mutex_);
+    waiters.swap(waiters_);
+    if (isConnected_) servers = servers_;
+  }
+  for (const Waiter& waiter : waiters) waiter.found(servers);
+}
+
+}  // namespace halvox::platform::linux_

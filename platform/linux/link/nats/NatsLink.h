@@ -1,0 +1,143 @@
+#pragma once
+
+#include <atomic>
+#include <chrono>
+#include <cstdint>
+#include <deque>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <thread>
+#include <vector>
+
+#include "platform/linux/Mutex.h"
+#include "platform/linux/link/nats/AckLedger.h"
+#include "platform/linux/link/nats/BurstLog.h"
+#include "platform/linux/link/nats/NatsHandles.h"
+#include "platform/linux/link/nats/NatsTlmReporting.h"
+#include "platform/linux/link/nats/PendingAcks.h"
+
+namespace halvox::platform::linux_ {
+
+// A message that was not given to the client library yet.
+struct OutgoingMessage {
+  NatsMessage message;
+  std::size_t bytes = 0;
+  std::shared_ptr<AckLedger> ledger;  // none when nobody flushes
+  AckLedger::Number number = 0;
+};
+
+// The one connection to the servers that all sessions share, and the one thread that may wait for
+// them: it connects, makes the stream and publishes. Callers only queue.
+//
+//   idle --first need--> connecting --> connected <--> away (the library reconnects for ever)
+//     ^                       |             |            |
+//     +------- failed --------+--- closed by the library (credentials refused) ---+
+//
+// Whoever asks for servers waits for the one attempt that is under way, at most kDiscoveryTime.
+// After a failed attempt the next one begins kAttemptPause later, and only when somebody asks.
+//
+// Messages wait in a queue bounded in bytes. While servers are away the library's own buffer
+// takes the first of them; when that and the queue are full, messages are refused with an error.
+// Nothing is sent a second time: to send a lost message again would put it behind later ones of its
+// session. What was on its way when a connection broke is counted as not acknowledged.
+//
+// All functions may be called by any thread, and none waits for a server but close().
+class NatsLink : public std::enable_shared_from_this<NatsLink> {
+ public:
+  static constexpr std::chrono::seconds kDiscoveryTime{8};
+  static constexpr std::chrono::seconds kAttemptPause{1};
+  static constexpr std::chrono::seconds kCloseTime{3};
+  static constexpr std::chrono::seconds kAckTime{10};
+  static constexpr std::size_t kQueueBytes = 32U << 20U;
+  static constexpr int kReconnectBufferBytes = 8 << 20;
+
+  NatsLink(Configuration::Link options, const NatsEnvironment& environment);
+  NatsLink(const NatsLink&) = delete;
+  NatsLink& operator=(const NatsLink&) = delete;
+  // Must be closed.
+  ~NatsLink();
+
+  // Calls back once with the servers' addresses, or none.
+  void discover(TLMReportingService::BackendsCallback found) HALVOX_EXCLUDES(mutex_);
+  // Takes the message, or says why not.
+  [[nodiscard]] std::optional<Error> send(OutgoingMessage message) HALVOX_EXCLUDES(mutex_);
+  // Lets what was taken go out, at most kCloseTime, then ends the connection and the library.
+  void close() HALVOX_EXCLUDES(mutex_);
+
+ private:
+  using Time = std::chrono::steady_clock::time_point;
+  struct Waiter {
+    std::uint64_t id;
+    TLMReportingService::BackendsCallback found;
+  };
+  enum class Step : std::uint8_t { kWait, kAnswer, kConnect, kSend, kDrop, kEnd };
+
+  // The thread (NatsLink.cpp).
+  void run() HALVOX_EXCLUDES(mutex_);
+  Step nextStep(Time now) HALVOX_REQUIRES(mutex_);
+  Step nextStepClosing(Time now) HALVOX_REQUIRES(mutex_);
+  void waitForChange() HALVOX_REQUIRES(mutex_);
+  void wakeThread() HALVOX_REQUIRES(mutex_);
+  void answerWaiters() HALVOX_EXCLUDES(mutex_);
+  void expire(std::uint64_t waiter) HALVOX_EXCLUDES(mutex_);
+  [[nodiscard]] std::optional<Error> refusal(const OutgoingMessage& message)
+      HALVOX_REQUIRES(mutex_);
+
+  // Publishing and what becomes of it (NatsLinkPublishing.cpp).
+  void publishSome() HALVOX_EXCLUDES(mutex_);
+  std::vector<OutgoingMessage> takeSome() HALVOX_REQUIRES(mutex_);
+  void putBack(std::vector<OutgoingMessage> messages, std::size_t first) HALVOX_EXCLUDES(mutex_);
+  static void onAcknowledged(jsCtx* context, natsMsg* message, jsPubAck* ack, jsPubAckErr* error,
+                             void* link);
+  void resolve(natsMsg* message, const jsPubAckErr* error) HALVOX_EXCLUDES(mutex_);
+  void countFailure(std::uint64_t messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
+  void abandon(std::vector<PendingAcks::Entry> entries) HALVOX_EXCLUDES(mutex_);
+  void fail(std::deque<OutgoingMessage> messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
+
+  // The connection (NatsLinkConnection.cpp).
+  void connect() HALVOX_EXCLUDES(mutex_);
+  [[nodiscard]] std::string open(NatsConnection& connection, JetStreamContext& context);
+  [[nodiscard]] natsStatus configure(natsOptions* options);
+  [[nodiscard]] natsStatus secure(natsOptions* options);
+  [[nodiscard]] std::string provideStream(jsCtx* context);
+  void dropConnection() HALVOX_EXCLUDES(mutex_);
+  void onAvailable(natsConnection* connection) HALVOX_EXCLUDES(mutex_);
+  void onAway(natsConnection* connection) HALVOX_EXCLUDES(mutex_);
+  void onClosed(natsConnection* connection) HALVOX_EXCLUDES(mutex_);
+
+  const Configuration::Link options_;
+  DispatchService& dispatch_;
+  StatisticsService& statistics_;
+  Counter& received_;
+  Counter& acknowledged_;
+  Counter& notAcknowledged_;
+
+  Mutex mutex_;
+  Condition changed_;
+  bool isIdle_ HALVOX_GUARDED_BY(mutex_) = false;  // the thread waits for a change
+  bool isConnected_ HALVOX_GUARDED_BY(mutex_) = false;
+  bool isLost_ HALVOX_GUARDED_BY(mutex_) = false;        // the library gave the connection up
+  bool isBufferFull_ HALVOX_GUARDED_BY(mutex_) = false;  // that of the library, while away
+  bool isWindowFull_ HALVOX_GUARDED_BY(mutex_) = false;
+  std::optional<Time> closeBy_ HALVOX_GUARDED_BY(mutex_);
+  Time nextAttempt_ HALVOX_GUARDED_BY(mutex_){};
+  std::string lastFailure_ HALVOX_GUARDED_BY(mutex_);  // empty when the last attempt succeeded
+  std::uint64_t lastWaiter_ HALVOX_GUARDED_BY(mutex_) = 0;
+  std::vector<Waiter> waiters_ HALVOX_GUARDED_BY(mutex_);
+  Array servers_ HALVOX_GUARDED_BY(mutex_);
+  std::deque<OutgoingMessage> queue_ HALVOX_GUARDED_BY(mutex_);
+  std::size_t queuedBytes_ HALVOX_GUARDED_BY(mutex_) = 0;
+  std::size_t maxPayload_ HALVOX_GUARDED_BY(mutex_) = 0;  // 0 when not known
+  PendingAcks pending_ HALVOX_GUARDED_BY(mutex_){AckWindow{}};
+  BurstLog failureLog_ HALVOX_GUARDED_BY(mutex_);
+  BurstLog attemptLog_ HALVOX_GUARDED_BY(mutex_);
+
+  // Changed by the thread alone, under the lock; other threads only compare the connection.
+  NatsConnection connection_;
+  JetStreamContext context_;
+  std::thread thread_;
+};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,180 @@
+#include "platform/linux/link/nats/NatsTlmReportingService.h"
+
+#include <array>
+#include <charconv>
+#include <cstdio>
+#include <random>
+#include <utility>
+
+#include "platform/linux/link/nats/NatsLog.h"
+#include "platform/linux/link/nats/SubjectToken.h"
+#include "platform/linux/store/PayloadEncoder.h"
+#include "platform/services.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog(natsLogCategory, "NatsTlmReportingService.cpp");
+constexpr const char* kMessageIdHeader = "Nats-Msg-Id";
+// What the header adds to a message, roughly: it counts where a server limits sizes.
+constexpr std::size_t kHeaderBytes = 80;
+
+// Keeps its buffer between messages, so each thread has one.
+PayloadEncoder& encoder() {
+  thread_local PayloadEncoder encoder;
+  return encoder;
+}
+
+std::string randomName() {
+  std::random_device device;
+  std::array<char, 40> text{};
+  std::snprintf(text.data(), text.size(), "%08x%08x", device(), device());
+  return text.data();
+}
+
+void append(std::string& text, std::uint64_t number) {
+  std::array<char, 24> digits;
+  text.append(digits.data(), std::to_chars(digits.begin(), digits.end(), number).ptr);
+}
+
+std::string sessionIdOf(const Dictionary& sessionInfo) {
+  const Value* const id = sessionInfo.find(kTLMReportingSessionInfoSessionID);
+  return std::to_string(id == nullptr ? 0 : id->toInt64());
+}
+
+}  // namespace
+
+LogCategory& natsLogCategory() {
+  static LogCategory& category = platform::log().createCategory("com.tarno.halvox", "link");
+  return category;
+}
+
+bool isNatsBuilt() { return true; }
+
+std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(Configuration::Link options,
+                                                       const NatsEnvironment& environment) {
+  return std::make_unique<NatsTlmReportingService>(std::move(options), environment);
+}
+
+// What all messages of a session have in common, put together once. Immutable but for its ledger.
+class NatsTlmReportingService::LinkedSession final : public TLMReportingSession {
+ public:
+  LinkedSession(const std::string& subject, const Dictionary& sessionInfo,
+                const Dictionary& userInfo)
+      : id_(sessionIdOf(sessionInfo)) {
+    // A client can choose the service name by its configuration, and not only as a string.
+    const Value* const service = userInfo.find(kTLMReportingUserInfoServiceName);
+    const std::string_view name = service == nullptr ? std::string_view() : service->string();
+    subject_ = subject + "." + subjectToken(name) + "." + id_;
+    beginning_ = R"({"sessionInfo":)";
+    beginning_ += encoder().encode(sessionInfo);
+    beginning_ += R"(,"userInfo":)";
+    beginning_ += encoder().encode(userInfo);
+    beginning_ += R"(,"category":)";
+    const Value* const batch = sessionInfo.find(kTLMReportingSessionInfoBatchEvent);
+    if (batch != nullptr && batch->toBool()) ledger_ = std::make_shared<AckLedger>();
+  }
+
+  [[nodiscard]] std::string description() const override { return subject_; }
+  [[nodiscard]] const std::string& subject() const { return subject_; }
+  [[nodiscard]] const std::string& beginning() const { return beginning_; }
+  // None for a session that does not batch.
+  [[nodiscard]] const std::shared_ptr<AckLedger>& ledger() const { return ledger_; }
+
+ private:
+  const std::string id_;
+  std::string subject_;
+  std::string beginning_;
+  std::shared_ptr<AckLedger> ledger_;
+};
+
+NatsTlmReportingService::NatsTlmReportingService(Configuration::Link options,
+                                                 const NatsEnvironment& environment)
+    : subject_(options.subject),
+      instance_(randomName()),
+      dispatch_(environment.dispatch),
+      link_(std::make_shared<NatsLink>(std::move(options), environment)) {}
+
+NatsTlmReportingService::~NatsTlmReportingService() { close(); }
+
+void NatsTlmReportingService::close() { link_->close(); }
+
+TLMReportingService::Token NatsTlmReportingService::TLMHierarchyTokenCreate() {
+  std::string text = instance_ + "-";
+  append(text, lastToken_.fetch_add(1, std::memory_order_relaxed) + 1);
+  return std::make_shared<TLMSecureHierarchyToken>(std::move(text));
+}
+
+TLMReportingService::Session NatsTlmReportingService::TLMReportingCreateSession(
+    const Dictionary& sessionInfo, const Dictionary& userInfo) {
+  return std::make_shared<LinkedSession>(subject_, sessionInfo, userInfo);
+}
+
+void NatsTlmReportingService::TLMReportingStartConfiguration(const Session&,
+                                                             BackendsCallback found) {
+  link_->discover(std::move(found));
+}
+
+TLMReportingOutcome NatsTlmReportingService::TLMReportingSendMessage(
+    const Session& session, const TLMReportingMessage& message) {
+  return send(static_cast<const LinkedSession&>(*session), message);
+}
+
+TLMReportingOutcome NatsTlmReportingService::TLMReportingSendOneMessage(
+    const Dictionary& sessionInfo, const Dictionary& userInfo, const TLMReportingMessage& message) {
+  return send(LinkedSession(subject_, sessionInfo, userInfo), message);
+}
+
+TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
+                                                  const TLMReportingMessage& message) {
+  const std::string_view payload = encoder().encode(message.payload);
+  std::string body;
+  body.reserve(session.beginning().size() + payload.size() + 48);
+  body += session.beginning();
+  append(body, message.category);
+  body += R"(,"type":)";
+  append(body, message.type);
+  body += R"(,"payload":)";
+  body += payload;
+  body += '}';
+  std::string id = instance_ + "-";
+  append(id, lastMessage_.fetch_add(1, std::memory_order_relaxed) + 1);
+
+  OutgoingMessage outgoing;
+  natsStatus status = natsMsg_Create(outgoing.message.out(), session.subject().c_str(), nullptr,
+                                     body.data(), static_cast<int>(body.size()));
+  if (status == NATS_OK) {
+    status = natsMsgHeader_Set(outgoing.message.get(), kMessageIdHeader, id.c_str());
+  }
+  if (status != NATS_OK) {
+    return {.sent = false, .error = Error{.description = natsStatus_GetText(status)}};
+  }
+  outgoing.bytes = body.size() + kHeaderBytes;
+  outgoing.ledger = session.ledger();
+  if (outgoing.ledger) outgoing.number = outgoing.ledger->add();
+  std::optional<Error> error = link_->send(std::move(outgoing));
+  return {.sent = !error, .error = std::move(error)};
+}
+
+void NatsTlmReportingService::TLMReportingFlushMessages(const Session& session,
+                                                        std::function<void()> flushed) {
+  const auto linked = std::static_pointer_cast<LinkedSession>(session);
+  const std::shared_ptr<AckLedger>& ledger = linked->ledger();
+  if (!ledger) return flushed();
+  const AckLedger::FlushId flush = ledger->flush(
+      [name = linked->subject(), flushed = std::move(flushed)](const AckTally& tally) {
+        if (tally.notAcknowledged > 0) {
+          kLog.error("flushed ", name, ": ", tally.acknowledged, " acknowledged, ",
+                     tally.notAcknowledged, " not");
+        } else {
+          kLog.info("flushed ", name, ": ", tally.acknowledged, " acknowledged, 0 not");
+        }
+        flushed();
+      });
+  if (flush == 0) return;
+  dispatch_.asyncAfterOnBackgroundQueue(kFlushTime, [ledger = std::weak_ptr(ledger), flush] {
+    if (const auto held = ledger.lock()) held->giveUp(flush);
+  });
+}
+
+}  // namespace halvox::platform::linux_
