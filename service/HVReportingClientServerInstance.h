@@ -114,9 +114,11 @@ class HVReportingClientServerInstance final
 
   void begin(const Session& session, const Delegate& delegate, const BoolReply& reply);
   void end(const Session& session, const Delegate& delegate);
-  void sendToNamedSessions(const MessageRequest& request) const;
+  void sendToNamedSessions(const MessageRequest& request, const Delegate& delegate) const;
   void sendToActiveSessions(const MessageRequest& request, const Delegate& delegate) const;
   void sendStandalone(const MessageRequest& request, const Delegate& delegate) const;
+  static void handToBackEnds(const MessageRequest& request, const Session& session,
+                             const Delegate& delegate);
 
   // Changes of the map and of what is in it go through these, which tell the delegate and the
   // account.

@@ -1,4 +1,6 @@
+#include "backends/HVReportingJoulebookUtility.h"
 #include "backends/HVReportingTallyhubBridge.h"
+#include "backends/HVReportingZUBBridge.h"
 #include "platform/clock.h"
 #include "platform/services.h"
 #include "platform/statistics.h"
@@ -16,6 +18,8 @@ constexpr std::string_view kErrorDomain = "com.tarno.audio.reporting";
 constexpr std::int64_t kReportingDisabled = 1;
 // What messages that come outside any session are sent as.
 constexpr ReporterID kStandaloneReporterID{1};
+// The name of a sender that was gone before it could be looked up.
+constexpr std::string_view kUnknownProcess = "unknown";
 
 // received = delivered + dropped + refused.
 struct MessageCounters {
@@ -84,21 +88,21 @@ void HVReportingClientServerInstance::carryOutSend(MessageRequest& request) {
   }
   stamp(request.message);
   if (request.reporterIDs.has_value()) {
-    sendToNamedSessions(request);
+    sendToNamedSessions(request, delegate);
   } else {
     sendToActiveSessions(request, delegate);
   }
   request.reply(std::nullopt);
 }
 
-void HVReportingClientServerInstance::sendToNamedSessions(const MessageRequest& request) const {
+void HVReportingClientServerInstance::sendToNamedSessions(const MessageRequest& request,
+                                                          const Delegate& delegate) const {
   bool delivered = false;
   for (const ReporterID reporterID : *request.reporterIDs) {
     if (reporterID == kNoReporterID) continue;
     const Session session = findReportingSessionForID(reporterID, Lookup::kAcrossAllClients);
     if (session == nullptr) continue;
-    HVReportingTallyhubBridge::handleEvent(request.message, request.category, request.type,
-                                           session);
+    handToBackEnds(request, session, delegate);
     session->sendMessage(request.message, request.category, request.type, nullptr);
     delivered = true;
   }
@@ -119,8 +123,7 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
   // intended.
   for (const Session& session : sessions) {
     session->sendMessage(request.message, request.category, request.type, nullptr);
-    HVReportingTallyhubBridge::handleEvent(request.message, request.category, request.type,
-                                           session);
+    handToBackEnds(request, session, delegate);
   }
 }
 
@@ -132,11 +135,23 @@ void HVReportingClientServerInstance::sendStandalone(const MessageRequest& reque
   session->setServiceType(AudioServiceType::kStandalone);
   session->updateConfigurationWithContentsOfConfiguration(
       {{"HostApplicationDisplayID", "Unknown"}});
-  HVReportingTallyhubBridge::handleEvent(request.message, request.category, request.type, session);
+  handToBackEnds(request, session, delegate);
   kServiceLog.notice("no active reporting sessions found, sending as standalone");
   HVReportingSession::sendSingleMessage(request.message, request.category, request.type,
                                         AudioServiceType::kStandalone, delegate->getDefaults(),
                                         nullptr);
+}
+
+// Each back-end decides by itself whether the message concerns it.
+void HVReportingClientServerInstance::handToBackEnds(const MessageRequest& request,
+                                                     const Session& session,
+                                                     const Delegate& delegate) {
+  const auto& [message, category, type, ids, senderName, reply] = request;
+  HVReportingTallyhubBridge::handleEvent(message, category, type, session);
+  HVReportingJoulebookUtility::handleEvent(message, category, type, session);
+  HVReportingZUBBridge::handleEvent(message, category, type, session);
+  delegate->handleEventForVEK(message, category, type, session,
+                              senderName == nullptr ? kUnknownProcess : *senderName);
 }
 
 }  // namespace halvox

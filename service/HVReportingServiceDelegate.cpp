@@ -86,6 +86,9 @@ std::vector<std::shared_ptr<HVReportingSession>> sessionsOf(
 HVReportingServiceDelegate::HVReportingServiceDelegate()
     : defaults_((createReportingQueue(), HVReportingDefaults())), features_(makeFeatures()) {
   listenForFeatureStateChanges();
+  if (HVReportingUtilityIsInternalBuild()) {
+    vekStateManager_ = std::make_unique<HVReportingUtilityVEKStateManager>();
+  }
 }
 
 bool HVReportingServiceDelegate::listenerShouldAcceptNewConnection(
@@ -175,6 +178,13 @@ void HVReportingServiceDelegate::noteSessionChange(
     const HVReportingClientServerInstance& client,
     const std::shared_ptr<HVReportingSession>& session, SessionChange change) {
   index_.noteChange(client, session, change);
+}
+
+void HVReportingServiceDelegate::handleEventForVEK(
+    const platform::Message& message, AudioEventCategory category, AudioEventType type,
+    const std::shared_ptr<HVReportingSession>& session, std::string_view processName) {
+  if (!HVReportingUtilityIsInternalBuild()) return;
+  vekStateManager_->handleEvent(message, category, type, session, processName);
 }
 
 }  // namespace halvox

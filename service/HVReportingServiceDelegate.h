@@ -7,6 +7,7 @@
 #include <string_view>
 #include <vector>
 
+#include "backends/HVReportingUtilityVEKStateManager.h"
 #include "platform/connection.h"
 #include "platform/notify.h"
 #include "platform/process.h"
@@ -63,6 +64,14 @@ class HVReportingServiceDelegate final
   void noteSessionChange(const HVReportingClientServerInstance& client,
                          const std::shared_ptr<HVReportingSession>& session,
                          SessionChange change) override;
+  void handleEventForVEK(const platform::Message& message, AudioEventCategory category,
+                         AudioEventType type, const std::shared_ptr<HVReportingSession>& session,
+                         std::string_view processName) override;
+
+  // Null on builds that are not internal.
+  [[nodiscard]] HVReportingUtilityVEKStateManager* vekStateManager() const {
+    return vekStateManager_.get();
+  }
 
  private:
   using Client = std::shared_ptr<HVReportingClientServerInstance>;
@@ -87,6 +96,8 @@ class HVReportingServiceDelegate final
   std::atomic<std::int64_t> activeSessionCount_{0};
   const platform::Dictionary defaults_;
   Features features_;  // never changes once made
+  std::unique_ptr<HVReportingUtilityVEKStateManager>
+      vekStateManager_;  // takes events on the reporting queue only
   // Ends with this object; those whom it gave handlers that refer to it look here first.
   const std::shared_ptr<const bool> alive_ = std::make_shared<bool>(true);
 };

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <string_view>
 #include <vector>
 
 #include "backends/HVReportingVocabulary.h"
@@ -47,6 +48,12 @@ class HVReportingServiceDelegateProtocol {
   [[nodiscard]] virtual std::int64_t activeSessionCount() const = 0;
   virtual void setActiveSessionCount(std::int64_t count) = 0;
 
+  // Hands a message of a session, that a process of that name sent, to the bug capture; does
+  // nothing on builds that are not internal.
+  virtual void handleEventForVEK(const platform::Message& message, AudioEventCategory category,
+                                 AudioEventType type,
+                                 const std::shared_ptr<HVReportingSession>& session,
+                                 std::string_view processName) = 0;
   // Clients tell of every change of their sessions, so that the look-ups above need not walk all
   // clients. Without effect for a client that is not in the list.
   virtual void noteSessionChange(const HVReportingClientServerInstance& client,

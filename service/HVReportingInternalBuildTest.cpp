@@ -1,0 +1,128 @@
+#include "backends/HVReportingUtility.h"
+#include "service/ServiceTest.h"
+
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+using platform::Value;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+// Has the question answered before any service is made: the answer holds for the process.
+class InternalBuild final : public testing::Environment {
+ public:
+  void SetUp() override {
+    platform::FakePlatform fakes;
+    fakes.deviceProperties.set("InternalBuild", true);
+    ASSERT_TRUE(HVReportingUtilityIsInternalBuild());
+  }
+};
+const testing::Environment* const kInternalBuild =
+    testing::AddGlobalTestEnvironment(new InternalBuild);  // owned by the test program
+
+class HVReportingInternalBuildTest : public ServiceTest {
+ protected:
+  HVReportingInternalBuildTest() {
+    createAndStart(client_, 7);
+    setServiceType(client_, AudioServiceType::kHaptics, 7);
+    forgetSteps();
+  }
+  ~HVReportingInternalBuildTest() override { platform_.dispatch.clear(); }
+
+  void report(const Connection& from, double seconds, const platform::Array& ids) {
+    call(from, "sendMessage",
+         {Dictionary{{"Haptic_Active_Hardware_Time_Seconds", seconds}}, kCategoryOfLeak,
+          std::uint16_t{8}, ids});
+  }
+  void reportToSeven(double seconds) {
+    const std::vector<Value> lists{platform::Array{7}};
+    report(client_, seconds, platform::Array(lists));
+  }
+  std::vector<platform::FakeDiagnosticReporterService::Request> requests() const {
+    return platform_.diagnosticReporters.requests();
+  }
+
+  static constexpr std::uint32_t kCategoryOfLeak = 0x08000001;
+  Connection client_ = connect(100, "leaker");
+};
+
+TEST_F(HVReportingInternalBuildTest, TheDelegateMakesOneStateManager) {
+  ASSERT_NE(delegate_->vekStateManager(), nullptr);
+  EXPECT_EQ(delegate_->vekStateManager()->leakedHapticsSessionCounter(), 0U);
+}
+
+TEST_F(HVReportingInternalBuildTest, LeakIsCountedAfterThePowerLogBeforeTheSession) {
+  reportToSeven(30);
+
+  const std::vector<std::string> all = steps();
+  const auto at = [&all](std::string_view text) {
+    return std::ranges::find(all, text) - all.begin();
+  };
+  EXPECT_LT(at("com.tarno.haptics.Session_Generic.Joulebook"), at("LeakedHapticsSessionInfo"));
+  EXPECT_LT(at("LeakedHapticsSessionInfo"), at("Incrementing VEK counter. leaker"));
+  EXPECT_LT(at("Incrementing VEK counter. leaker"), at("0x21044838"));
+  EXPECT_LT(at("0x21044838"), static_cast<std::ptrdiff_t>(all.size()));
+}
+
+TEST_F(HVReportingInternalBuildTest, LeakForActiveSessionsIsCountedAfterTheSession) {
+  report(client_, 30, {});
+
+  const std::vector<std::string> all = steps();
+  const auto at = [&all](std::string_view text) {
+    return std::ranges::find(all, text) - all.begin();
+  };
+  EXPECT_LT(at("0x21044838"), at("LeakedHapticsSessionInfo"));
+  EXPECT_LT(at("LeakedHapticsSessionInfo"), at("Incrementing VEK counter. leaker"));
+  EXPECT_LT(at("Incrementing VEK counter. leaker"), static_cast<std::ptrdiff_t>(all.size()));
+}
+
+TEST_F(HVReportingInternalBuildTest, TheSecondLeakBringsASnapshotOfItsSender) {
+  reportToSeven(30);
+  const Connection other = connect(101, "second");
+  const std::vector<Value> lists{platform::Array{7}};
+
+  report(other, 31, platform::Array(lists));
+
+  ASSERT_EQ(requests().size(), 1U);
+  EXPECT_EQ(requests()[0].signature, (Dictionary{{"domain", "Acoustat"},
+                                                 {"type", "haptics"},
+                                                 {"subType", "Session_Generic"},
+                                                 {"subtypeContext", "Joulebook"},
+                                                 {"detectedProcess", "second"}}));
+}
+
+// The stamps of arrival are part of what is compared.
+TEST_F(HVReportingInternalBuildTest, OneReportSentTwiceIsTwoOnceTimeHasPassed) {
+  reportToSeven(30);
+  reportToSeven(30);
+  EXPECT_THAT(requests(), IsEmpty());
+
+  platform_.clock.advance(std::chrono::seconds(1));
+  reportToSeven(30);
+  EXPECT_EQ(requests().size(), 1U);
+}
+
+TEST_F(HVReportingInternalBuildTest, StandaloneLeaksCountOnceEach) {
+  stop(client_, 7);
+
+  report(client_, 30, {});
+  EXPECT_EQ(delegate_->vekStateManager()->leakedHapticsSessionCounter(), 1U);
+  report(client_, 31, {});
+
+  ASSERT_EQ(requests().size(), 1U);
+  EXPECT_EQ(*requests()[0].signature.find("type"), Value("standalone"));
+}
+
+TEST_F(HVReportingInternalBuildTest, ASenderThatWasGoneIsUnknown) {
+  const Connection gone = connectUnregistered(200, "brief");
+  platform_.process.removeProcess(200);
+  run();
+
+  report(gone, 30, {});
+
+  EXPECT_TRUE(platform_.log.containsText("Incrementing VEK counter. unknown"));
+}
+
+}  // namespace
+}  // namespace halvox
