@@ -4,6 +4,7 @@
 #include <memory>
 #include <span>
 #include <string>
+#include <string_view>
 
 #include <sys/uio.h>
 
@@ -27,8 +28,25 @@ class LogSink {
 // The line of an entry: escaped, so that it is one line, and bounded.
 std::string logLineText(const LogEntry& entry);
 
-// Lines of text on a descriptor, which is not owned:
+// Entries as lines of text, each with its end:
 //   2024-05-01T12:00:00.123+02:00 error [com.tarno.halvox:hvrs] the line
+// Belongs to one thread.
+class LogLineFormatter {
+ public:
+  LogLineFormatter();
+  ~LogLineFormatter();
+  LogLineFormatter(const LogLineFormatter&) = delete;
+  LogLineFormatter& operator=(const LogLineFormatter&) = delete;
+
+  // Valid until the next call.
+  [[nodiscard]] std::string_view format(const LogEntry& entry);
+
+ private:
+  struct Parts;
+  const std::unique_ptr<Parts> parts_;
+};
+
+// Lines of text on a descriptor, which is not owned.
 std::unique_ptr<LogSink> makeTextLogSink(int descriptor);
 
 // What sends fields to the journal: sd_journal_sendv, or what stands for it in a test.

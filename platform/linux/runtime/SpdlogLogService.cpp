@@ -1,5 +1,6 @@
 #include "platform/linux/runtime/SpdlogLogService.h"
 
+#include <algorithm>
 #include <vector>
 
 #include <systemd/sd-journal.h>
@@ -13,18 +14,26 @@ namespace halvox::platform::linux_ {
 class SpdlogLogService::Category final : public LogCategory {
  public:
   Category(SpdlogLogService& service, std::string subsystem, std::string category)
-      : LogCategory(service.threshold_),
+      : LogCategory(std::min(service.levels_.written,
+                             service.levels_.kept.value_or(service.levels_.written))),
         service_(service),
         subsystem_(std::move(subsystem)),
         category_(std::move(category)) {}
 
   void write(LogLevel level, std::string_view line) override {
-    service_.add({.time = std::chrono::system_clock::now(),
-                  .level = level,
-                  .subsystem = subsystem_,
-                  .category = category_,
-                  .text = std::string(line.substr(0, kLongestLogLine)),
-                  .wholeLength = line.size()});
+    LogEntry entry{.time = std::chrono::system_clock::now(),
+                   .level = level,
+                   .subsystem = subsystem_,
+                   .category = category_,
+                   .text = {},
+                   .wholeLength = line.size()};
+    const std::string_view start = line.substr(0, kLongestLogLine);
+    if (service_.levels_.kept.has_value() && level >= *service_.levels_.kept) {
+      service_.memory_->add(entry, start);
+    }
+    if (level < service_.levels_.written) return;
+    entry.text = start;
+    service_.add(std::move(entry));
   }
 
  private:
@@ -33,9 +42,10 @@ class SpdlogLogService::Category final : public LogCategory {
   const std::string category_;
 };
 
-SpdlogLogService::SpdlogLogService(LogLevel threshold, std::unique_ptr<LogSink> sink,
+SpdlogLogService::SpdlogLogService(Levels levels, std::unique_ptr<LogSink> sink,
                                    StatisticsService& statistics)
-    : threshold_(threshold),
+    : levels_(levels),
+      memory_(levels.kept.has_value() ? std::make_unique<LogMemory>(*levels.kept) : nullptr),
       sink_(std::move(sink)),
       received_(statistics.counter("log", "received")),
       written_(statistics.counter("log", "delivered")),
@@ -43,12 +53,12 @@ SpdlogLogService::SpdlogLogService(LogLevel threshold, std::unique_ptr<LogSink> 
       failed_(statistics.counter("log", "dropped: not taken by the reader")),
       thread_(&SpdlogLogService::run, this) {}
 
-std::unique_ptr<SpdlogLogService> SpdlogLogService::onStandardError(LogLevel threshold,
+std::unique_ptr<SpdlogLogService> SpdlogLogService::onStandardError(Levels levels,
                                                                     StatisticsService& statistics) {
   std::unique_ptr<LogSink> sink = isJournalStream(STDERR_FILENO)
                                       ? makeJournalLogSink(::sd_journal_sendv)
                                       : makeTextLogSink(STDERR_FILENO);
-  return std::make_unique<SpdlogLogService>(threshold, std::move(sink), statistics);
+  return std::make_unique<SpdlogLogService>(levels, std::move(sink), statistics);
 }
 
 SpdlogLogService::~SpdlogLogService() { stop(); }
@@ -66,6 +76,10 @@ void SpdlogLogService::stop() {
   queue_.end();
   sink_->finish();
   if (thread_.joinable()) thread_.join();
+}
+
+LogMemory::Contents SpdlogLogService::keptLines() const {
+  return memory_ == nullptr ? LogMemory::Contents{} : memory_->contents();
 }
 
 void SpdlogLogService::add(LogEntry entry) {

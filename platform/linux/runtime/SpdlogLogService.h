@@ -5,11 +5,13 @@
 #include <functional>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
 #include <thread>
 #include <utility>
 
 #include "platform/linux/Mutex.h"
+#include "platform/linux/runtime/LogMemory.h"
 #include "platform/linux/runtime/LogQueue.h"
 #include "platform/linux/runtime/LogSink.h"
 #include "platform/log.h"
@@ -23,14 +25,23 @@ namespace halvox::platform::linux_ {
 // Control characters in a line are escaped and very long lines are cut, since clients' texts are
 // logged. Nothing runs while nothing is logged.
 //
+// Beside that the newest lines stay in memory at a level of their own, for captures of diagnostics.
+//
 // Any thread may log. The categories live as long as the service, which main keeps to the end.
 class SpdlogLogService final : public LogService {
  public:
-  // Lines below `threshold` are not wanted. `statistics` must outlive the service.
-  SpdlogLogService(LogLevel threshold, std::unique_ptr<LogSink> sink,
-                   StatisticsService& statistics);
+  // The least level that is written, and the least that is kept in memory; none: nothing is kept.
+  struct Levels {
+    Levels(LogLevel toWrite) : written(toWrite) {}  // NOLINT(google-explicit-constructor)
+    Levels(LogLevel toWrite, LogLevel toKeep) : written(toWrite), kept(toKeep) {}
+    LogLevel written;
+    std::optional<LogLevel> kept;
+  };
+
+  // Lines below both levels are not wanted. `statistics` must outlive the service.
+  SpdlogLogService(Levels levels, std::unique_ptr<LogSink> sink, StatisticsService& statistics);
   // To standard error, or to the journal when that is where standard error goes.
-  static std::unique_ptr<SpdlogLogService> onStandardError(LogLevel threshold,
+  static std::unique_ptr<SpdlogLogService> onStandardError(Levels levels,
                                                            StatisticsService& statistics);
   ~SpdlogLogService() override;
 
@@ -40,6 +51,9 @@ class SpdlogLogService final : public LogService {
   // thread. Lines logged later are dropped and counted. May be called again.
   void stop();
 
+  // The newest lines that were kept in memory.
+  [[nodiscard]] LogMemory::Contents keptLines() const;
+
  private:
   class Category;
 
@@ -47,7 +61,8 @@ class SpdlogLogService final : public LogService {
   void run();
   void reportLosses();
 
-  const LogLevel threshold_;
+  const Levels levels_;
+  const std::unique_ptr<LogMemory> memory_;  // null: nothing is kept
   const std::unique_ptr<LogSink> sink_;
   Counter& received_;
   Counter& written_;

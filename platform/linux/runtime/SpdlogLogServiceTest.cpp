@@ -82,6 +82,25 @@ TEST_F(SpdlogLogServiceTest, LineHasTimeLevelNamesAndText) {
                            "\n"));
 }
 
+TEST_F(SpdlogLogServiceTest, KeepsLinesInMemoryAtALevelOfTheirOwn) {
+  auto sink = std::make_unique<MemoryLogSink>();
+  MemoryLogSink& written = *sink;
+  SpdlogLogService service({LogLevel::kError, LogLevel::kInfo}, std::move(sink), statistics_);
+  LogCategory& category = service.createCategory("com.tarno.halvox", "hvrs");
+  for (const auto& [level, text] : {std::pair(LogLevel::kDebug, "too little"),
+                                    std::pair(LogLevel::kInfo, "kept"),
+                                    std::pair(LogLevel::kError, "kept and written")}) {
+    if (category.isEnabled(level)) category.write(level, text);
+  }
+  service.stop();
+
+  EXPECT_FALSE(category.isEnabled(LogLevel::kDebug));
+  EXPECT_EQ(written.lines(), std::vector<std::string>{"kept and written"});
+  EXPECT_EQ(service.keptLines().lines, 2U);
+  EXPECT_THAT(service.keptLines().text, HasSubstr(" info [com.tarno.halvox:hvrs] kept\n"));
+  EXPECT_EQ(count("received"), 1U);
+}
+
 TEST_F(SpdlogLogServiceTest, LevelsHaveTheirOwnWords) {
   EXPECT_THAT(writtenText(LogLevel::kDebug, "x"), HasSubstr(" debug ["));
   EXPECT_THAT(writtenText(LogLevel::kInfo, "x"), HasSubstr(" info ["));

@@ -4,6 +4,7 @@
 #include <cerrno>
 #include <chrono>
 #include <cstdint>
+#include <memory>
 #include <optional>
 
 #include <poll.h>
@@ -71,9 +72,7 @@ class LevelFlag final : public spdlog::custom_flag_formatter {
 class TextLogSink final : public LogSink {
  public:
   explicit TextLogSink(int descriptor)
-      : descriptor_(descriptor), finish_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {
-    formatter_.add_flag<LevelFlag>('*').set_pattern("%Y-%m-%dT%H:%M:%S.%e%z %* [%n] %v");
-  }
+      : descriptor_(descriptor), finish_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
 
   std::size_t write(std::span<const LogEntry> entries) override;
   void finish() override {
@@ -82,34 +81,21 @@ class TextLogSink final : public LogSink {
   }
 
  private:
-  void format(const LogEntry& entry);
   bool writeAll(std::string_view text);
   bool waitForReader();
 
   const int descriptor_;
   const UniqueFd finish_;
-  spdlog::pattern_formatter formatter_;
-  spdlog::memory_buf_t line_;
+  LogLineFormatter formatter_;
   std::optional<Clock::time_point> deadline_;  // once the end was asked for
 };
 
 std::size_t TextLogSink::write(std::span<const LogEntry> entries) {
   std::size_t written = 0;
   for (const LogEntry& entry : entries) {
-    format(entry);
-    if (writeAll({line_.data(), line_.size()})) ++written;
+    if (writeAll(formatter_.format(entry))) ++written;
   }
   return written;
-}
-
-void TextLogSink::format(const LogEntry& entry) {
-  std::string name(entry.subsystem);
-  name += ':';
-  name += entry.category;
-  const std::string text = logLineText(entry);
-  line_.clear();
-  formatter_.format(spdlog::details::log_msg(entry.time, {}, name, spdlogLevel(entry.level), text),
-                    line_);
 }
 
 bool TextLogSink::writeAll(std::string_view text) {
@@ -142,6 +128,28 @@ bool TextLogSink::waitForReader() {
 }
 
 }  // namespace
+
+struct LogLineFormatter::Parts {
+  Parts() { formatter.add_flag<LevelFlag>('*').set_pattern("%Y-%m-%dT%H:%M:%S.%e%z %* [%n] %v"); }
+
+  spdlog::pattern_formatter formatter;
+  spdlog::memory_buf_t line;
+};
+
+LogLineFormatter::LogLineFormatter() : parts_(std::make_unique<Parts>()) {}
+
+LogLineFormatter::~LogLineFormatter() = default;
+
+std::string_view LogLineFormatter::format(const LogEntry& entry) {
+  std::string name(entry.subsystem);
+  name += ':';
+  name += entry.category;
+  const std::string text = logLineText(entry);
+  parts_->line.clear();
+  parts_->formatter.format(
+      spdlog::details::log_msg(entry.time, {}, name, spdlogLevel(entry.level), text), parts_->line);
+  return {parts_->line.data(), parts_->line.size()};
+}
 
 std::string logLineText(const LogEntry& entry) {
   std::string line;

@@ -1,0 +1,66 @@
+#include "platform/linux/runtime/LogMemory.h"
+
+#include <algorithm>
+#include <memory>
+
+#include "platform/linux/runtime/LogSink.h"
+
+namespace halvox::platform::linux_ {
+
+LogMemory::LogMemory(LogLevel level, Bounds bounds) : level_(level), bounds_(bounds) {
+  lines_.resize(bounds_.lines);
+  ring_.resize(bounds_.bytes);
+}
+
+void LogMemory::add(const LogEntry& entry, std::string_view line) {
+  const MutexLock lock(mutex_);
+  line = line.substr(0, ring_.size());
+  // A text lies in one piece: the rest of the ring stays empty when it is too short.
+  const std::uint64_t room = ring_.size() - end_ % ring_.size();
+  if (room < line.size()) end_ += room;
+  // What this text will lie over, and what lay in the part left empty, goes.
+  const std::uint64_t end = end_ + line.size();
+  while (firstLine_ != endLine_ && (lines_[firstLine_ % lines_.size()].begin + ring_.size() < end ||
+                                    endLine_ - firstLine_ == lines_.size())) {
+    ++firstLine_;
+  }
+  line.copy(&ring_[end_ % ring_.size()], line.size());
+  lines_[endLine_ % lines_.size()] = {.time = entry.time,
+                                      .subsystem = entry.subsystem,
+                                      .category = entry.category,
+                                      .begin = end_,
+                                      .length = line.size(),
+                                      .wholeLength = entry.wholeLength,
+                                      .level = entry.level};
+  ++endLine_;
+  end_ = end;
+}
+
+LogMemory::Contents LogMemory::contents() const {
+  std::vector<Line> lines;
+  std::string ring;
+  Contents contents;
+  lines.reserve(bounds_.lines);
+  ring.reserve(bounds_.bytes);
+  {
+    const MutexLock lock(mutex_);
+    for (std::uint64_t at = firstLine_; at != endLine_; ++at) {
+      lines.push_back(lines_[at % lines_.size()]);
+    }
+    ring.assign(ring_, 0, std::min<std::uint64_t>(end_, ring_.size()));
+    contents.added = endLine_;
+  }
+  contents.lines = lines.size();
+  LogLineFormatter formatter;
+  for (const Line& line : lines) {
+    contents.text += formatter.format({.time = line.time,
+                                       .level = line.level,
+                                       .subsystem = line.subsystem,
+                                       .category = line.category,
+                                       .text = ring.substr(line.begin % bounds_.bytes, line.length),
+                                       .wholeLength = line.wholeLength});
+  }
+  return contents;
+}
+
+}  // namespace halvox::platform::linux_
