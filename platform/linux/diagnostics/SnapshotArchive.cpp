@@ -1,0 +1,93 @@
+#include "platform/linux/diagnostics/SnapshotArchive.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <ctime>
+
+#include <archive.h>
+#include <archive_entry.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/diagnostics/BoundedFile.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using Entry = UniqueHandle<archive_entry*, archive_entry_free>;
+
+constexpr mode_t kMode = 0600;
+
+}  // namespace
+
+struct SnapshotArchive::Writer {
+  UniqueFd file;
+  UniqueHandle<struct archive*, archive_write_free> handle;
+};
+
+SnapshotArchive::SnapshotArchive(std::filesystem::path temporaryPath, std::uint64_t mostBytes)
+    : path_(std::move(temporaryPath)), writer_(std::make_unique<Writer>()), room_(mostBytes) {}
+
+SnapshotArchive::~SnapshotArchive() {
+  // Before the file goes: freeing an archive that is not finished writes its rest.
+  if (writer_->handle) archive_write_fail(writer_->handle.get());
+  writer_->handle.reset();
+  if (isCreated_ && !isKept_) ::unlink(path_.c_str());
+}
+
+SnapshotArchive::Failure SnapshotArchive::open() {
+  ::unlink(path_.c_str());
+  writer_->file.reset(
+      ::open(path_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, kMode));
+  if (!writer_->file) return path_.native() + ": " + errorText(errno);
+  isCreated_ = true;
+  writer_->handle.reset(archive_write_new());
+  archive* const out = writer_->handle.get();
+  if (archive_write_set_format_pax_restricted(out) != ARCHIVE_OK ||
+      archive_write_add_filter_zstd(out) != ARCHIVE_OK ||
+      archive_write_set_bytes_in_last_block(out, 1) != ARCHIVE_OK ||
+      archive_write_open_fd(out, writer_->file.get()) != ARCHIVE_OK) {
+    return failed();
+  }
+  return std::nullopt;
+}
+
+SnapshotArchive::Failure SnapshotArchive::add(const std::string& name, std::string_view bytes) {
+  const Entry entry(archive_entry_new());
+  archive_entry_set_pathname(entry.get(), name.c_str());
+  archive_entry_set_filetype(entry.get(), AE_IFREG);
+  archive_entry_set_perm(entry.get(), kMode);
+  archive_entry_set_size(entry.get(), static_cast<la_int64_t>(bytes.size()));
+  archive_entry_set_mtime(entry.get(), std::time(nullptr), 0);
+  archive* const out = writer_->handle.get();
+  if (archive_write_header(out, entry.get()) != ARCHIVE_OK) return failed();
+  if (archive_write_data(out, bytes.data(), bytes.size()) !=
+      static_cast<la_ssize_t>(bytes.size())) {
+    return failed();
+  }
+  room_ -= std::min<std::uint64_t>(room_, bytes.size());
+  return std::nullopt;
+}
+
+SnapshotArchive::Failure SnapshotArchive::finish() {
+  if (archive_write_close(writer_->handle.get()) != ARCHIVE_OK) return failed();
+  writer_->handle.reset();
+  struct stat status {};
+  if (::fsync(writer_->file.get()) != 0 || ::fstat(writer_->file.get(), &status) != 0) {
+    return path_.native() + ": " + errorText(errno);
+  }
+  size_ = static_cast<std::uint64_t>(status.st_size);
+  return std::nullopt;
+}
+
+SnapshotArchive::Failure SnapshotArchive::failed() const {
+  const int error = archive_errno(writer_->handle.get());
+  const char* text = archive_error_string(writer_->handle.get());
+  // The library's own numbers, which are no errno, are negative.
+  if (error > 0) return path_.native() + ": " + errorText(error);
+  return path_.native() + ": " + (text == nullptr ? "the archive cannot be written" : text);
+}
+
+}  // namespace halvox::platform::linux_

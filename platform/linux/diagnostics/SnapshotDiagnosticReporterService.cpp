@@ -1,0 +1,274 @@
+#include "platform/linux/diagnostics/SnapshotDiagnosticReporterService.h"
+
+#include <string>
+#include <thread>
+#include <utility>
+#include <variant>
+
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include "platform/clock.h"
+#include "platform/dispatch.h"
+#include "platform/linux/Mutex.h"
+#include "platform/linux/diagnostics/SignatureKeys.h"
+#include "platform/linux/diagnostics/SnapshotArchive.h"
+#include "platform/linux/diagnostics/SnapshotCollector.h"
+#include "platform/linux/diagnostics/SnapshotDirectory.h"
+#include "platform/linux/runtime/ThreadSetup.h"
+#include "platform/linux/store/StoreLog.h"
+#include "platform/log.h"
+#include "platform/services.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr int kNiceness = 10;
+constexpr const char* kBusy = "another snapshot is in work";
+constexpr const char* kEnding = "the service is ending";
+
+LogCategory& diagnosticsCategory() {
+  static LogCategory& category = log().createCategory("com.tarno.halvox", "diagnostics");
+  return category;
+}
+
+constexpr UnitLog kLog(diagnosticsCategory, "SnapshotReporter");
+
+// What became of one request: a file, or why there is none.
+struct Outcome {
+  std::filesystem::path path{};
+  std::uint64_t size = 0;
+  std::string failure{};
+};
+
+Dictionary errorReply(const std::string& why) { return {{"error", why}}; }
+
+std::string_view textOf(const Dictionary& signature, const char* key) {
+  const Value* value = signature.find(key);
+  return value == nullptr ? std::string_view{} : value->string();
+}
+
+}  // namespace
+
+// The thread of snapshots and what it works on. Held by the service and by its reporters.
+class SnapshotDiagnosticReporterService::Worker {
+ public:
+  using Reply = AILDiagnosticReporter::Reply;
+
+  Worker(SnapshotOptions options, SnapshotPartners partners)
+      : options_(std::move(options)),
+        partners_(std::move(partners)),
+        directory_(options_.storageDirectory),
+        received_(partners_.statistics.counter("snapshots", "received")),
+        delivered_(partners_.statistics.counter("snapshots", "delivered")),
+        busy_(partners_.statistics.counter("snapshots", "dropped: another in work")),
+        failed_(partners_.statistics.counter("snapshots", "dropped: cannot be written")),
+        ending_(partners_.statistics.counter("snapshots", "dropped: service ending")) {}
+  ~Worker() { stop(); }
+  Worker(const Worker&) = delete;
+  Worker& operator=(const Worker&) = delete;
+
+  void request(SnapshotRequest request, Reply reply);
+  void setStateSource(StateSource source);
+  void removeLeftovers() const { directory_.removeLeftovers(); }
+  void stop();
+
+ private:
+  enum class Taken : std::uint8_t { kTaken, kBusy, kEnding };
+  struct Work {
+    SnapshotRequest request;
+    Reply reply;
+  };
+
+  Taken tryTake(Work& work);
+  void run();
+  void carryOut(const Work& work);
+  [[nodiscard]] Outcome capture(const SnapshotRequest& request);
+  [[nodiscard]] Dictionary conclude(const SnapshotRequest& request, const Outcome& outcome,
+                                    double seconds);
+
+  const SnapshotOptions options_;
+  const SnapshotPartners partners_;
+  const SnapshotDirectory directory_;
+  Counter& received_;
+  Counter& delivered_;
+  Counter& busy_;
+  Counter& failed_;
+  Counter& ending_;
+  WaitableFlag stop_;
+  OncePerSecond errorLines_;  // the thread only
+  Mutex mutex_;
+  Condition wakeUp_;
+  StateSource state_ HALVOX_GUARDED_BY(mutex_);
+  std::optional<Work> waiting_ HALVOX_GUARDED_BY(mutex_);
+  bool isInWork_ HALVOX_GUARDED_BY(mutex_) = false;
+  std::thread thread_ HALVOX_GUARDED_BY(mutex_);
+};
+
+void SnapshotDiagnosticReporterService::Worker::request(SnapshotRequest request, Reply reply) {
+  received_.add();
+  Work work{std::move(request), std::move(reply)};
+  const Taken taken = tryTake(work);
+  if (taken == Taken::kTaken) return;
+  (taken == Taken::kBusy ? busy_ : ending_).add();
+  // Not from here: a reply comes after this has returned.
+  dispatch().asyncAfterOnBackgroundQueue(
+      std::chrono::nanoseconds(0),
+      [reply = std::move(work.reply), why = taken == Taken::kBusy ? kBusy : kEnding] {
+        reply(errorReply(why));
+      });
+}
+
+SnapshotDiagnosticReporterService::Worker::Taken SnapshotDiagnosticReporterService::Worker::tryTake(
+    Work& work) {
+  const MutexLock lock(mutex_);
+  if (stop_.isRaised()) return Taken::kEnding;
+  if (isInWork_) return Taken::kBusy;
+  isInWork_ = true;
+  waiting_.emplace(std::move(work));
+  if (!thread_.joinable()) thread_ = std::thread(&Worker::run, this);
+  wakeUp_.notifyOne();
+  return Taken::kTaken;
+}
+
+void SnapshotDiagnosticReporterService::Worker::setStateSource(StateSource source) {
+  const MutexLock lock(mutex_);
+  state_ = std::move(source);
+}
+
+void SnapshotDiagnosticReporterService::Worker::stop() {
+  std::thread ended;
+  {
+    const MutexLock lock(mutex_);
+    stop_.raise();
+    wakeUp_.notifyOne();
+    ended = std::move(thread_);
+  }
+  if (ended.joinable()) ended.join();
+}
+
+void SnapshotDiagnosticReporterService::Worker::run() {
+  setUpThread("snapshots");
+  // Captures must not slow down what they are about. Programs that they start inherit it.
+  ::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), kNiceness);
+  for (;;) {
+    std::optional<Work> work;
+    {
+      const MutexLock lock(mutex_);
+      while (!waiting_.has_value() && !stop_.isRaised()) wakeUp_.wait(mutex_);
+      if (!waiting_.has_value()) return;
+      work = std::exchange(waiting_, std::nullopt);
+    }
+    carryOut(*work);
+  }
+}
+
+void SnapshotDiagnosticReporterService::Worker::carryOut(const Work& work) {
+  const auto begun = std::chrono::steady_clock::now();
+  const Outcome outcome = capture(work.request);
+  const std::chrono::duration<double> took = std::chrono::steady_clock::now() - begun;
+  const Dictionary response = conclude(work.request, outcome, took.count());
+  {
+    // Before the reply: whoever has it may ask for the next one.
+    const MutexLock lock(mutex_);
+    isInWork_ = false;
+  }
+  work.reply(response);
+}
+
+Outcome SnapshotDiagnosticReporterService::Worker::capture(const SnapshotRequest& request) {
+  if (const auto failure = directory_.prepare()) return {.failure = failure->why};
+  SnapshotSources sources{.paths = options_.paths,
+                          .log = partners_.log,
+                          .state = {},
+                          .stateWithin = options_.stateWithin,
+                          .dumpWithin = options_.dumpWithin};
+  {
+    const MutexLock lock(mutex_);
+    sources.state = state_;
+  }
+  const Deadline deadline(stop_, std::chrono::steady_clock::now() + options_.collectWithin);
+  SnapshotArchive archive(directory_.temporaryPath(), options_.mostBytes);
+  if (auto failure = archive.open()) return {.failure = std::move(*failure)};
+  SnapshotCollector collector(request, sources, archive, deadline);
+  if (auto failure = collector.collect()) return {.failure = std::move(*failure)};
+  if (auto failure = archive.finish()) return {.failure = std::move(*failure)};
+  auto published = directory_.publish(request.time, textOf(request.signature, signature_key::kType),
+                                      textOf(request.signature, signature_key::kSubType));
+  if (auto* failure = std::get_if<SnapshotDirectory::Failure>(&published)) {
+    return {.failure = std::move(failure->why)};
+  }
+  archive.keep();
+  return {.path = std::get<std::filesystem::path>(std::move(published)), .size = archive.size()};
+}
+
+Dictionary SnapshotDiagnosticReporterService::Worker::conclude(const SnapshotRequest& request,
+                                                               const Outcome& outcome,
+                                                               double seconds) {
+  if (!outcome.failure.empty()) {
+    (stop_.isRaised() ? ending_ : failed_).add();
+    if (errorLines_.tryPass()) kLog.error("no snapshot was taken: ", outcome.failure);
+    return errorReply(outcome.failure);
+  }
+  directory_.keepNewest(options_.keep, outcome.path);
+  if (partners_.recorder != nullptr) {
+    partners_.recorder->recordSnapshot(request.time, request.signature, outcome.path);
+  }
+  delivered_.add();
+  kLog.notice("snapshot taken: ", outcome.path.native(), ", ", outcome.size, " bytes");
+  return {{"path", outcome.path.native()}, {"size_bytes", outcome.size}, {"seconds", seconds}};
+}
+
+// Asks the worker, which it keeps.
+class SnapshotDiagnosticReporterService::Reporter final : public AILDiagnosticReporter {
+ public:
+  explicit Reporter(std::shared_ptr<Worker> worker) : worker_(std::move(worker)) {}
+
+  Dictionary makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
+                           std::string_view subtypeContext, std::string_view detectedProcess,
+                           const std::optional<Dictionary>& triggerThresholdValues) const override {
+    Dictionary signature{{signature_key::kDomain, domain},
+                         {signature_key::kType, type},
+                         {signature_key::kSubType, subType},
+                         {signature_key::kSubtypeContext, subtypeContext},
+                         {signature_key::kDetectedProcess, detectedProcess}};
+    if (triggerThresholdValues.has_value()) {
+      signature.set(signature_key::kTriggerThresholdValues, *triggerThresholdValues);
+    }
+    return signature;
+  }
+
+  void requestSnapshot(const Dictionary& signature, double durationSeconds,
+                       const std::optional<Dictionary>& event,
+                       const std::optional<Dictionary>& payload, Reply reply) override {
+    worker_->request({.time = clock().currentDate(),
+                      .signature = signature,
+                      .durationSeconds = durationSeconds,
+                      .event = event,
+                      .payload = payload},
+                     std::move(reply));
+  }
+
+ private:
+  const std::shared_ptr<Worker> worker_;
+};
+
+SnapshotDiagnosticReporterService::SnapshotDiagnosticReporterService(SnapshotOptions options,
+                                                                     SnapshotPartners partners)
+    : worker_(std::make_shared<Worker>(std::move(options), std::move(partners))) {}
+
+SnapshotDiagnosticReporterService::~SnapshotDiagnosticReporterService() { stop(); }
+
+std::shared_ptr<AILDiagnosticReporter> SnapshotDiagnosticReporterService::createReporter() {
+  return std::make_shared<Reporter>(worker_);
+}
+
+void SnapshotDiagnosticReporterService::setStateSource(StateSource source) {
+  worker_->setStateSource(std::move(source));
+}
+
+void SnapshotDiagnosticReporterService::removeLeftovers() const { worker_->removeLeftovers(); }
+
+void SnapshotDiagnosticReporterService::stop() { worker_->stop(); }
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,107 @@
+#include "platform/linux/diagnostics/SnapshotReader.h"
+
+#include "platform/linux/diagnostics/SnapshotTestSupport.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::Pair;
+
+class SnapshotReaderTest : public ::testing::Test {
+ protected:
+  // The error of unpacking such an archive, or nothing.
+  std::string unpack(const std::vector<TestEntry>& entries,
+                     ExistingFiles existing = ExistingFiles::kRefuse) {
+    writeArchive(archive, entries);
+    const auto result = extractSnapshot(archive, target, existing);
+    const auto* error = std::get_if<SnapshotReadError>(&result);
+    return error == nullptr ? "" : error->description;
+  }
+
+  ScratchFolder scratch;
+  const std::filesystem::path archive = scratch.path() / "a.tar.zst";
+  const std::filesystem::path target = scratch.path() / "out";
+};
+
+TEST_F(SnapshotReaderTest, UnpacksWhatWasPacked) {
+  EXPECT_EQ(unpack({{"manifest.json", "{}"}, {"asound/card0/id", "Dummy"}}), "");
+
+  EXPECT_EQ(readText(target / "manifest.json"), "{}");
+  EXPECT_EQ(readText(target / "asound/card0/id"), "Dummy");
+}
+
+TEST_F(SnapshotReaderTest, ReadsTheFilesThatAreAskedForAndThere) {
+  writeArchive(archive, {{"a", "1"}, {"b", "2"}});
+
+  const auto texts = readSnapshotFiles(archive, {"b", "c"});
+
+  ASSERT_EQ(texts.index(), 0U);
+  EXPECT_THAT(std::get<0>(texts), ElementsAre(Pair("b", "2")));
+}
+
+TEST_F(SnapshotReaderTest, NamesAndLinksThatLeadOutAreRefused) {
+  const std::string absolute = (scratch.path() / "absolute").native();
+
+  EXPECT_THAT(unpack({{"../up", "x"}}), HasSubstr("something else than plain files"));
+  EXPECT_THAT(unpack({{"a/../../up", "x"}}), HasSubstr("something else than plain files"));
+  EXPECT_THAT(unpack({{absolute, "x"}}), HasSubstr("something else than plain files"));
+  EXPECT_THAT(unpack({{"link", "", scratch.path().native()}, {"link/up", "x"}}),
+              HasSubstr("something else than plain files"));
+  EXPECT_FALSE(std::filesystem::exists(scratch.path() / "up"));
+  EXPECT_FALSE(std::filesystem::exists(absolute));
+}
+
+TEST_F(SnapshotReaderTest, LinksOnTheWayAreNotFollowed) {
+  std::filesystem::create_directories(target);
+  std::filesystem::create_directory(scratch.path() / "elsewhere");
+  std::filesystem::create_directory_symlink(scratch.path() / "elsewhere", target / "asound");
+
+  EXPECT_NE(unpack({{"asound/cards", "x"}}, ExistingFiles::kReplace), "");
+  EXPECT_TRUE(std::filesystem::is_empty(scratch.path() / "elsewhere"));
+}
+
+TEST_F(SnapshotReaderTest, ExistingFileIsRefusedBeforeAnythingIsUnpacked) {
+  writeText(target / "b", "mine");
+
+  EXPECT_THAT(unpack({{"a", "1"}, {"b", "2"}}), HasSubstr("it is there already"));
+  EXPECT_EQ(readText(target / "b"), "mine");
+  EXPECT_FALSE(std::filesystem::exists(target / "a"));
+
+  EXPECT_EQ(unpack({{"a", "1"}, {"b", "2"}}, ExistingFiles::kReplace), "");
+  EXPECT_EQ(readText(target / "b"), "2");
+}
+
+TEST_F(SnapshotReaderTest, ForcedUnpackingReplacesALinkNotItsTarget) {
+  writeText(scratch.path() / "mine", "mine");
+  std::filesystem::create_directories(target);
+  std::filesystem::create_symlink(scratch.path() / "mine", target / "a");
+
+  EXPECT_EQ(unpack({{"a", "1"}}, ExistingFiles::kReplace), "");
+
+  EXPECT_EQ(readText(scratch.path() / "mine"), "mine");
+  EXPECT_EQ(readText(target / "a"), "1");
+}
+
+TEST_F(SnapshotReaderTest, BrokenAndMissingArchivesAreNamed) {
+  writeText(archive, "this is no archive");
+  const auto broken = readSnapshotFiles(archive, {"a"});
+  const auto missing = readSnapshotFiles(scratch.path() / "none", {"a"});
+
+  ASSERT_EQ(broken.index(), 1U);
+  EXPECT_THAT(std::get<1>(broken).description, HasSubstr("a.tar.zst: "));
+  ASSERT_EQ(missing.index(), 1U);
+  EXPECT_THAT(std::get<1>(missing).description, HasSubstr("No such file or directory"));
+}
+
+TEST_F(SnapshotReaderTest, TruncatedArchiveIsAnError) {
+  writeArchive(archive, {{"a", std::string(100'000, 'x')}, {"b", "2"}});
+  std::filesystem::resize_file(archive, std::filesystem::file_size(archive) / 2);
+
+  EXPECT_EQ(readSnapshotFiles(archive, {"a", "b"}).index(), 1U);
+  EXPECT_EQ(extractSnapshot(archive, target, ExistingFiles::kRefuse).index(), 1U);
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,86 @@
+#pragma once
+
+#include <chrono>
+#include <filesystem>
+#include <future>
+#include <map>
+#include <memory>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "platform/fake/FakePlatform.h"
+#include "platform/linux/diagnostics/SnapshotDiagnosticReporterService.h"
+
+namespace halvox::platform::linux_ {
+
+// A directory that is removed with all its content.
+class ScratchFolder {
+ public:
+  ScratchFolder();
+  ScratchFolder(const ScratchFolder&) = delete;
+  ScratchFolder& operator=(const ScratchFolder&) = delete;
+  ~ScratchFolder();
+  [[nodiscard]] const std::filesystem::path& path() const { return path_; }
+
+ private:
+  std::filesystem::path path_;
+};
+
+void writeText(const std::filesystem::path& file, std::string_view text);
+[[nodiscard]] std::string readText(const std::filesystem::path& file);
+
+// What one archive holds, by name, read with nothing of ours.
+[[nodiscard]] std::map<std::string, std::string> archiveFiles(const std::filesystem::path& file);
+// Writes an archive as ours are, with entries that ours never have when the names say so.
+struct TestEntry {
+  std::string name;
+  std::string text{};
+  std::string linkTarget{};  // not empty: a symbolic link
+};
+void writeArchive(const std::filesystem::path& file, const std::vector<TestEntry>& entries);
+
+// A service over fakes, in a scratch directory, with a system of its own to look at.
+class SnapshotTest : public ::testing::Test {
+ protected:
+  SnapshotTest();
+
+  void start() {
+    service = std::make_unique<SnapshotDiagnosticReporterService>(
+        options,
+        SnapshotPartners{.statistics = platform.statistics, .log = log, .recorder = recorder});
+  }
+  // Asks for a snapshot; the response comes later.
+  [[nodiscard]] std::future<Dictionary> request(const std::string& process = "player");
+  // Asks and waits for the response.
+  [[nodiscard]] Dictionary snapshot(const std::string& process = "player") {
+    return responseOf(request(process));
+  }
+  [[nodiscard]] static Dictionary responseOf(std::future<Dictionary> response);
+  [[nodiscard]] static std::string textOf(const Dictionary& response, const char* key);
+  [[nodiscard]] std::filesystem::path directory() const {
+    return options.storageDirectory / "snapshots";
+  }
+  // The names in the directory of snapshots, sorted.
+  [[nodiscard]] std::vector<std::string> names() const;
+  [[nodiscard]] std::uint64_t counted(std::string_view name) const {
+    return platform.statistics.value("snapshots", name);
+  }
+  void expectBalance() const {
+    EXPECT_EQ(counted("received"), counted("delivered") + counted("dropped: another in work") +
+                                       counted("dropped: cannot be written") +
+                                       counted("dropped: service ending"));
+  }
+
+  ScratchFolder scratch;
+  FakePlatform platform;
+  SnapshotOptions options;
+  std::function<LogMemory::Contents()> log;
+  SnapshotRecorder* recorder = nullptr;
+  std::unique_ptr<SnapshotDiagnosticReporterService> service;
+};
+
+}  // namespace halvox::platform::linux_
