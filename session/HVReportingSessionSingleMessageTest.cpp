@@ -58,12 +58,12 @@ TEST_F(HVReportingSessionSingleMessageTest, GoesOutAfterOneSecondOnTheBackground
   EXPECT_THAT(platform_.journal.entries(), IsEmpty());
 
   platform_.dispatch.advance(1ms);
-  EXPECT_THAT(platform_.journal.entries(),
-              ElementsAre(JournalEntry{JournalKind::kTracePoint, "0x21044838"},
-                          JournalEntry{JournalKind::kLogLine, "sending single message"},
-                          JournalEntry{JournalKind::kLink, "send single 4/1"},
-                          JournalEntry{JournalKind::kLogLine,
-                                       "message {a = 1} : category 4 : type 1"}));
+  EXPECT_THAT(
+      platform_.journal.entries(),
+      ElementsAre(JournalEntry{JournalKind::kTracePoint, "0x21044838"},
+                  JournalEntry{JournalKind::kLogLine, "sending single message"},
+                  JournalEntry{JournalKind::kLink, "send single 4/1"},
+                  JournalEntry{JournalKind::kLogLine, "message {a = 1} : category 4 : type 1"}));
   EXPECT_EQ(platform_.log.lines().back().level, LogLevel::kDebug);
 }
 
@@ -105,9 +105,10 @@ TEST_F(HVReportingSessionSingleMessageTest, EveryMessageIsAccountedFor) {
   send(AudioServiceType::kHaptics);
   platform_.dispatch.advance(1s);
 
-  EXPECT_THAT(platform_.statistics.values("single messages"),
-              testing::UnorderedElementsAre(testing::Pair("received", 3U),
-                                            testing::Pair("sent", 2U), testing::Pair("failed", 1U)));
+  EXPECT_THAT(
+      platform_.statistics.values("single messages"),
+      testing::UnorderedElementsAre(testing::Pair("received", 3U), testing::Pair("sent", 2U),
+                                    testing::Pair("failed", 1U)));
 }
 
 TEST_F(HVReportingSessionSingleMessageTest, TellsTheFrameworkThatItHasNoSession) {
@@ -142,8 +143,8 @@ TEST_F(HVReportingSessionSingleMessageTest, SendsCleanKeysAndTheCategoryWithoutI
   EXPECT_EQ(sent[0].category, 11);
   EXPECT_EQ(sent[0].type, 18);
   EXPECT_EQ(sent[0].payload, (Dictionary{{"sample_rate", 48000}}));
-  EXPECT_TRUE(platform_.log.containsText(
-      "message {sample rate = 48000} : category -2147483637 : type 18"));
+  EXPECT_TRUE(
+      platform_.log.containsText("message {sample rate = 48000} : category -2147483637 : type 18"));
 }
 
 TEST_F(HVReportingSessionSingleMessageTest, NoMessageAtAllIsSentEmpty) {

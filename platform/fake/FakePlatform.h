@@ -8,6 +8,7 @@
 #include "platform/fake/FakeDiagnosticReporterService.h"
 #include "platform/fake/FakeDispatchService.h"
 #include "platform/fake/FakeFeatureFlagService.h"
+#include "platform/fake/FakeFileService.h"
 #include "platform/fake/FakeIOReportService.h"
 #include "platform/fake/FakeKdebugService.h"
 #include "platform/fake/FakeKtraceService.h"
@@ -50,7 +51,7 @@ struct FakePlatform {
   FakeFeatureFlagService featureFlags;
   FakeAnalyticsService analytics{journal};
   FakeDiagnosticReporterService diagnosticReporters{journal};
-  AbsentFiles files;
+  FakeFileService files{journal};
   FakeMetricService metrics{journal};
   FakeNotifyService notify;
   FakePowerLogService powerLog{journal};

@@ -17,6 +17,7 @@ enum class JournalKind : unsigned char {
   kPowerEvent,       // text: the event's name
   kSnapshotRequest,  // text: the signature's description
   kLink,             // text: what the real-time framework was asked for, as "send session 1 4/1"
+  kFile,             // text: what became of a directory or file, as "file /a/b.json"
   kReply,            // text: the name of the method that was answered
   kTermination,      // text: the exit status
   kNote,             // text: whatever the test wrote

@@ -1,0 +1,60 @@
+#pragma once
+
+#include <map>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+#include "platform/fake/Journal.h"
+#include "platform/files.h"
+
+namespace halvox::platform {
+
+// A file service that keeps what it was given. A committed file has the path
+// "/root<directory>/<name>". Any thread may call; the test reads from its own.
+class FakeFileService final : public FileService {
+ public:
+  struct File {
+    std::string directory;
+    std::string name;
+    std::vector<std::pair<std::string, Dictionary>> objects{};
+    friend bool operator==(const File&, const File&) = default;
+  };
+
+  // Does not own the journal, which must outlive it.
+  explicit FakeFileService(Journal& journal) : journal_(journal) {}
+
+  // From now on directories cannot be made, or files not be committed, for that reason; none: they
+  // can again.
+  void setDirectoryError(std::optional<Error> error);
+  void setFileError(std::optional<Error> error);
+
+  // What was asked for, in order and whatever became of it: "directory /a 511", "file /a/b.json",
+  // "object key = {foo = 1}", "commit".
+  [[nodiscard]] std::vector<std::string> steps() const;
+  // The permissions of each directory, by its path.
+  [[nodiscard]] std::map<std::string, std::uint32_t> directories() const;
+  // The files that were committed, in that order.
+  [[nodiscard]] std::vector<File> files() const;
+  std::optional<Error> createDirectory(std::string_view path, std::uint32_t permissions) override;
+  std::unique_ptr<JsonArrayFile> createJsonArrayFile(std::string_view directory,
+                                                     std::string_view name) override;
+
+ private:
+  friend class FakeJsonArrayFile;
+  void step(std::string text);
+  std::optional<Error> add(File file);
+
+  Journal& journal_;
+  mutable std::mutex mutex_;
+  std::optional<Error> directoryError_;
+  std::optional<Error> fileError_;
+  std::map<std::string, std::uint32_t> directories_;
+  std::vector<File> files_;
+  std::vector<std::string> steps_;
+};
+
+}  // namespace halvox::platform

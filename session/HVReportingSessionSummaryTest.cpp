@@ -1,0 +1,246 @@
+#include <memory>
+#include <string>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "platform/fake/FakePlatform.h"
+#include "session/HVReportingSession.h"
+#include "session/SummaryTest.h"
+
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+using platform::LogLevel;
+using platform::Message;
+using platform::Value;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+class HVReportingSessionSummaryTest : public SummaryTest {};
+
+// --- the summary event --------------------------------------------------------------------------
+
+TEST_F(HVReportingSessionSummaryTest, AnEmptyHistoryHasNoSummary) {
+  EXPECT_EQ(session_->createSummaryEventForSession(), std::nullopt);
+}
+
+TEST_F(HVReportingSessionSummaryTest, ASessionThatIsNotStartedHasNoSummary) {
+  send({{"foo", 1}});
+  session_->stop();
+
+  EXPECT_EQ(session_->createSummaryEventForSession(), std::nullopt);
+}
+
+TEST_F(HVReportingSessionSummaryTest, JoinsTheValuesOfAKeyInOrderOfTheHistory) {
+  send({{"foo", 1}});
+  send({{"foo", 2}});
+
+  EXPECT_EQ(session_->createSummaryEventForSession(),
+            Message(Dictionary{{"HV_Session_Summary_Event", "3"},
+                               {"foo", "1,2"},
+                               {"audiotag", "PlaybackStart,PlaybackStart"}}));
+}
+
+TEST_F(HVReportingSessionSummaryTest, KeysThatOnlySomeMessagesHaveAreJoinedToo) {
+  send({{"foo", 1}, {"bar", "x"}});
+  send({{"other", true}});
+  send({{"bar", "y"}, {"foo", 2}});
+
+  const Dictionary summary = *session_->createSummaryEventForSession();
+
+  EXPECT_EQ(*summary.find("foo"), Value("1,2"));
+  EXPECT_EQ(*summary.find("bar"), Value("x,y"));
+  EXPECT_EQ(*summary.find("other"), Value("1"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, NumbersAreInTheirShortestForm) {
+  send({{"n", 0.1}});
+  send({{"n", 48000.0}});
+  send({{"n", std::int64_t{-7}}});
+  send({{"n", 1.0F / 3}});
+
+  EXPECT_EQ(*session_->createSummaryEventForSession()->find("n"), Value("0.1,48000,-7,0.33333334"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, ContainersAreShownAsTheLogShowsThem) {
+  send({{"list", platform::Array{1, "x"}}});
+  send({{"list", Dictionary{{"k", 2}}}});
+  send({{"list", ""}});
+
+  EXPECT_EQ(*session_->createSummaryEventForSession()->find("list"), Value("(1, x),{k = 2},"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, AClientsOwnSummaryKeyFollowsTheServiceType) {
+  send({{"HV_Session_Summary_Event", "mine"}});
+
+  EXPECT_EQ(*session_->createSummaryEventForSession()->find("HV_Session_Summary_Event"),
+            Value("3,mine"));
+}
+
+// --- stop ---------------------------------------------------------------------------------------
+
+TEST_F(HVReportingSessionSummaryTest, StopOfAnEmptyRunTellsNothing) {
+  platform_.journal.clear();
+
+  session_->stop();
+
+  EXPECT_THAT(platform_.journal.texts(),
+              ElementsAre("ending session 7", "ending session 7", "0x21044830"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, StopWithoutStartTellsNothing) {
+  session_->stop();
+  platform_.journal.clear();
+
+  session_->stop();
+
+  EXPECT_THAT(platform_.journal.texts(), ElementsAre("ending session 7"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, WithoutVolumeThereIsASummaryEventAlone) {
+  send({{"foo", 1}});
+  platform_.journal.clear();
+  platform_.log.clear();
+
+  session_->stop();
+
+  EXPECT_THAT(platform_.journal.texts(),
+              ElementsAre("ending session 7", "ending session 7", "0x21044830",
+                          "sending summary event for reporter 7",
+                          "sending message for session owned by 7", "0x21044838"));
+  EXPECT_THAT(platform_.log.texts(LogLevel::kDefault),
+              ElementsAre("sending summary event for reporter 7"));
+  EXPECT_EQ(platform_.log.lines().back().category, "hvrr");
+}
+
+TEST_F(HVReportingSessionSummaryTest, StopStepsInOrder) {
+  playTwoVolumes();
+  platform_.analytics.wantOnly({"com.tarno.halvox.Volume.Summary"});
+  platform_.journal.clear();
+
+  session_->stop();
+
+  const std::string send = "sending message for session owned by 7";
+  const std::string ofAll = "com.tarno.halvox.Volume.Summary";
+  const std::string ofService = "com.tarno.haptics.Volume.Summary";
+  EXPECT_THAT(platform_.journal.texts(),
+              ElementsAre("ending session 7", "ending session 7", "0x21044830",
+                          "sending volume event for reporter 7",        //
+                          send, "0x21044838", ofAll, ofAll, ofService,  //
+                          send, "0x21044838", ofAll, ofAll, ofService,  //
+                          "sending summary event for reporter 7", send, "0x21044838"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, VolumeIsLoggedAtDefaultLevelOnce) {
+  playTwoVolumes();
+  platform_.log.clear();
+
+  session_->stop();
+
+  EXPECT_THAT(
+      platform_.log.texts(LogLevel::kDefault),
+      ElementsAre("sending volume event for reporter 7", "sending summary event for reporter 7"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, AnalyticsGetTheVolumeMessagesUntagged) {
+  playTwoVolumes();
+
+  session_->stop();
+
+  const auto events = platform_.analytics.events("com.tarno.halvox.Volume.Summary");
+  ASSERT_EQ(events.size(), 2U);
+  EXPECT_EQ(*events[0].payload, (Dictionary{{"session_selected_format", "Unknown"},
+                                            {"active_devices", "Unknown"},
+                                            {"RQSessionVolumeOperationProcess", "Unknown"},
+                                            {"RQSessionVolume", 0.5},
+                                            {"RQSessionVolumeBucketed", "0.5"},
+                                            {"play_seconds", 10},
+                                            {"play_secondsBucketed", "10"},
+                                            {"HostApplicationDisplayID", "Unknown"}}));
+  EXPECT_EQ(*events[1].payload->find("RQSessionVolume"), Value(0.75));
+}
+
+TEST_F(HVReportingSessionSummaryTest, AnalyticsGetNoSummaryEvent) {
+  send({{"foo", 1}});
+
+  session_->stop();
+
+  EXPECT_THAT(platform_.analytics.sentNames(), IsEmpty());
+}
+
+// The minimum playing time is half a second.
+TEST_F(HVReportingSessionSummaryTest, VolumesOfHalfASecondAreNotReported) {
+  playing(0.5, 10);
+  playing(0.75, 10.5);
+  silent(11.25);
+
+  session_->stop();
+
+  const auto events = platform_.analytics.events("com.tarno.halvox.Volume.Summary");
+  ASSERT_EQ(events.size(), 1U);
+  EXPECT_EQ(*events[0].payload->find("RQSessionVolume"), Value(0.75));
+}
+
+TEST_F(HVReportingSessionSummaryTest, TheLinkGetsVolumeMessagesThenTheSummaryThenTheFlush) {
+  session_->stop();
+  session_->setTlmReportingEnabled(true);
+  platform_.tlmReporting.answerDiscoveries(
+      platform::FakeTlmReportingService::Answering::kBeforeReturning, platform::Array{"server"});
+  session_->start();
+  playTwoVolumes();
+  platform_.dispatch.runUntilIdle();
+  platform_.journal.clear();
+
+  session_->stop();
+  platform_.dispatch.runUntilIdle();
+
+  EXPECT_THAT(platform_.journal.texts(platform::JournalKind::kLink),
+              ElementsAre("send session 1 14/11", "send session 1 14/11",
+                          "send session 1 65535/65535", "flush session 1"));
+  EXPECT_EQ(*platform_.tlmReporting.messages().back().payload.find("audiotag"),
+            Value("UndefinedUnknown"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, TheSummaryCoversTheVolumeMessages) {
+  session_->setTlmReportingEnabled(true);
+  playTwoVolumes();
+  platform_.tlmReporting.answerDiscoveries(
+      platform::FakeTlmReportingService::Answering::kBeforeReturning, platform::Array{"server"});
+  session_->stop();
+  session_->start();
+  playTwoVolumes();
+
+  session_->stop();
+  platform_.dispatch.runUntilIdle();
+
+  const Dictionary summary = platform_.tlmReporting.messages().back().payload;
+  EXPECT_EQ(*summary.find("play_seconds"), Value("10,5"));
+  EXPECT_EQ(*summary.find("RQSessionVolume"), Value("0.5,0.75,0.75,0.5,0.75"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, EqualVolumeMessagesInARowAreRecordedOnce) {
+  playing(0.5, 10);
+  silent(20);
+  playing(0.5, 30);
+  silent(40);
+  platform_.log.clear();
+
+  session_->stop();
+
+  EXPECT_TRUE(platform_.log.containsText("dropping redundant event"));
+  EXPECT_EQ(platform_.analytics.events("com.tarno.halvox.Volume.Summary").size(), 2U);
+}
+
+TEST_F(HVReportingSessionSummaryTest, OnOtherThanInternalBuildsNoFileIsWritten) {
+  send({{"foo", 1}});
+
+  session_->stop();
+
+  EXPECT_THAT(platform_.files.steps(), IsEmpty());
+}
+
+}  // namespace
+}  // namespace halvox
