@@ -125,6 +125,7 @@ LinuxPlatform::LinuxPlatform(const Configuration& configuration)
       preferenceReader_(configuration_.preferencesDirectory),
       notify_(configuration_.notifyDirectory, preferenceReader_, statistics_),
       preferences_(preferenceReader_, statistics_),
+      files_(configuration_.storage.root, statistics_),
       dispatch_(*log_, statistics_) {}
 
 Services LinuxPlatform::services() {

@@ -6,6 +6,7 @@
 
 #include "platform/fake/AbsentServices.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
+#include "platform/linux/files/RootedFileService.h"
 #include "platform/linux/runtime/AsioDispatchService.h"
 #include "platform/linux/runtime/Backpressure.h"
 #include "platform/linux/runtime/Configuration.h"
@@ -70,7 +71,7 @@ class LinuxPlatform {
   SqliteStore store_;
   SqliteAnalyticsService analytics_;
   AbsentDiagnosticReporters diagnosticReporters_;
-  AbsentFiles files_;
+  RootedFileService files_;
   AbsentMetrics metrics_;
   PreferenceReader preferenceReader_;
   InotifyNotifyService notify_;

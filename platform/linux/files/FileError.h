@@ -1,0 +1,22 @@
+#pragma once
+
+#include <string>
+#include <string_view>
+#include <system_error>
+
+#include "platform/connection.h"
+
+namespace halvox::platform::linux_ {
+
+// What went wrong with a file or directory, in words: "cannot <what> <path>: <system's error>".
+inline Error fileError(std::string_view what, std::string_view path, int systemError) {
+  std::string text = "cannot ";
+  text += what;
+  text += ' ';
+  text += path;
+  text += ": ";
+  text += std::generic_category().message(systemError);
+  return {.domain = "com.tarno.halvox.files", .code = systemError, .description = std::move(text)};
+}
+
+}  // namespace halvox::platform::linux_

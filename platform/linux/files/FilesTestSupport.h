@@ -1,0 +1,61 @@
+#pragma once
+
+// What the tests of this folder share.
+
+#include <algorithm>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "platform/linux/files/RootedFileService.h"
+#include "platform/linux/runtime/CounterStatisticsService.h"
+
+namespace halvox::platform::linux_ {
+
+// A service over a root of its own, which is not there yet.
+class FilesTest : public testing::Test {
+ protected:
+  FilesTest() = default;
+  ~FilesTest() override {
+    std::error_code ignored;
+    std::filesystem::remove_all(scratch_, ignored);
+  }
+
+  static std::filesystem::path makeScratch() {
+    std::string pattern = (std::filesystem::temp_directory_path() / "halvox-files-XXXXXX").string();
+    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
+    return pattern;
+  }
+  // The code of the error that the file ends with, 0 when it was written.
+  static std::int64_t codeOf(JsonArrayFile& file) {
+    std::string path;
+    const auto error = file.commit(path);
+    return error.has_value() ? error->code : 0;
+  }
+  static std::string textOf(const std::filesystem::path& path) {
+    std::ifstream file(path);
+    return {std::istreambuf_iterator<char>(file), {}};
+  }
+  static std::vector<std::string> namesIn(const std::filesystem::path& directory) {
+    std::vector<std::string> names;
+    for (const auto& entry : std::filesystem::directory_iterator(directory)) {
+      names.push_back(entry.path().filename().string());
+    }
+    std::ranges::sort(names);
+    return names;
+  }
+  std::uint64_t count(const char* name) { return statistics_.counter("files", name).value(); }
+
+  const std::filesystem::path scratch_ = makeScratch();
+  const std::filesystem::path root_ = scratch_ / "root";
+  const std::filesystem::path outside_ = scratch_ / "outside";
+  CounterStatisticsService statistics_;
+  RootedFileService service_{root_, statistics_};
+};
+
+}  // namespace halvox::platform::linux_
