@@ -14,6 +14,7 @@
 #include "platform/process.h"
 #include "platform/tlm_reporting.h"
 #include "platform/value.h"
+#include "session/DriverSnapShot.h"
 #include "session/Guarded.h"
 #include "session/MessageHistory.h"
 #include "session/ReplyCallbacks.h"
@@ -85,6 +86,13 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   }
   // Gets one signal for each answer of the framework about back-ends; made at the first call.
   [[nodiscard]] const std::shared_ptr<platform::DispatchSemaphore>& tlmreportingBackendSemaphore();
+  // What the drivers had counted when the session started; none while nothing was sampled.
+  [[nodiscard]] std::optional<DriverSnapShot> driverSnapShot() const {
+    return driverSnapShot_.copy();
+  }
+  void setDriverSnapShot(std::optional<DriverSnapShot> snapShot) {
+    driverSnapShot_.set(std::move(snapShot));
+  }
   // What the client connection wants to call when the session was stopped. The session only keeps
   // it; whoever takes it out calls it.
   [[nodiscard]] BoolReply transactionCompleteBlock() const;
@@ -190,6 +198,7 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   Guarded<platform::Dictionary> configuration_;
   Guarded<std::optional<MessageHistory>> history_;
   Guarded<BoolReply> transactionCompleteBlock_;
+  Guarded<std::optional<DriverSnapShot>> driverSnapShot_;
   std::once_flag tlmReportingQueueMade_;
   std::shared_ptr<platform::DispatchQueue> tlmReportingQueue_;
   std::once_flag backendSemaphoreMade_;

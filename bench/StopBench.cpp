@@ -1,0 +1,114 @@
+#include <fstream>
+#include <memory>
+#include <string>
+
+#include <benchmark/benchmark.h>
+#include <malloc.h>
+
+#include "bench/NullPlatform.h"
+#include "session/HVReportingSession.h"
+
+// What it costs to stop a session with a long history: its walk for volume, its summary event, and
+// letting go of it. Counts the memory too: `peak_ratio` is the most that the process had beside
+// what it had before the session, in units of what the history had when the stop began.
+
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+
+constexpr std::int64_t kMessages = 1'000'000;
+
+bench::NullPlatform& nullPlatform() {
+  static auto* instance = new bench::NullPlatform(platform::LogLevel::kError);
+  return *instance;
+}
+
+void stamp(Dictionary& message, std::int64_t number) {
+  message.set("hvreporting_timestamp", 1.7e9 + 0.25 * static_cast<double>(number));
+  message.set("systemuptime_sec", number / 4);
+  message.set("processuptime_ms", number * 250);
+}
+
+// Ten fields, as audio frameworks send them, and the stamps.
+Dictionary makeMessage(std::int64_t number) {
+  Dictionary message;
+  message.reserve(14);
+  message.set("frame_counter", number);
+  message.set("sample_rate", 48000.0);
+  message.set("channels", std::int32_t{2});
+  message.set("io_buffer_frames", std::int32_t{512});
+  message.set("is_running", true);
+  message.set("volume", 0.75);
+  message.set("route", "Speaker");
+  message.set("format", "lpcm/float32");
+  message.set("device_uid", "alsa_output.pci-0000_00_1f.3.analog-stereo");
+  message.set("latency_ms", 10.67);
+  stamp(message, number);
+  return message;
+}
+
+// Another volume each time, held for longer than the least time: every message ends an interval.
+Dictionary makeVolumeMessage(std::int64_t number) {
+  Dictionary message;
+  message.set("RQSessionVolume", static_cast<double>(number % 16) / 16);
+  message.set("RQSessionVolumePlayingState", 1);
+  stamp(message, 4 * number);
+  return message;
+}
+
+double statusKilobytes(const std::string& name) {
+  std::ifstream status("/proc/self/status");
+  std::string word;
+  while (status >> word) {
+    if (word != name) continue;
+    double value = 0;
+    status >> value;
+    return value;
+  }
+  return 0;
+}
+
+void forgetPeak() { std::ofstream("/proc/self/clear_refs") << "5"; }
+
+template <typename Make>
+std::shared_ptr<HVReportingSession> startedSession(Make make) {
+  const auto session =
+      std::make_shared<HVReportingSession>(ReporterID{1}, HVReportingSession::ProcessIdentifiers{});
+  session->start();
+  for (std::int64_t number = 0; number < kMessages; ++number) {
+    session->sendMessage(make(number), AudioEventCategory::kPlayback, AudioEventType::kState,
+                         nullptr);
+  }
+  return session;
+}
+
+template <typename Make>
+void BM_Stop(benchmark::State& state, Make make) {
+  nullPlatform();
+  double ratio = 0;
+  double history = 0;
+  for (auto _ : state) {
+    state.PauseTiming();
+    ::malloc_trim(0);
+    const double base = statusKilobytes("VmRSS:");
+    const auto session = startedSession(make);
+    history = statusKilobytes("VmRSS:") - base;
+    forgetPeak();
+    state.ResumeTiming();
+    session->stop();
+    state.PauseTiming();
+    ratio = (statusKilobytes("VmHWM:") - base) / history;
+    state.ResumeTiming();
+  }
+  state.counters["history_mb"] = history / 1024;
+  state.counters["peak_ratio"] = ratio;
+}
+
+BENCHMARK_CAPTURE(BM_Stop, ten_fields, makeMessage)->Unit(benchmark::kMillisecond)->Iterations(3);
+BENCHMARK_CAPTURE(BM_Stop, a_volume_each, makeVolumeMessage)
+    ->Unit(benchmark::kMillisecond)
+    ->Iterations(3);
+
+}  // namespace
+}  // namespace halvox

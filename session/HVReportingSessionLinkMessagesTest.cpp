@@ -1,0 +1,391 @@
+#include <chrono>
+#include <memory>
+#include <optional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "session/LinkTest.h"
+
+namespace halvox::link_test {
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::Pair;
+using testing::UnorderedElementsAre;
+using namespace std::chrono_literals;
+
+class HVReportingSessionLinkMessagesTest : public LinkTest {};
+
+// --- messages -----------------------------------------------------------------------------------
+
+TEST_F(HVReportingSessionLinkMessagesTest, MessagesThatWaitedAreSentInOrder) {
+  holdDiscoveries();
+  start();
+  send({{"a", 1}});
+  send({{"a", 2}});
+  send({{"a", 3}});
+  run();
+  EXPECT_THAT(framework_.messages(), IsEmpty());
+
+  framework_.answerDiscovery(kServers);
+  run();
+
+  EXPECT_THAT(payloads(), ElementsAre(Dictionary{{"a", 1}, {"audiotag", "PlaybackStart"}},
+                                      Dictionary{{"a", 2}, {"audiotag", "PlaybackStart"}},
+                                      Dictionary{{"a", 3}, {"audiotag", "PlaybackStart"}}));
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, MessagesThatWaitedInVainAreDroppedWithoutALine) {
+  holdDiscoveries();
+  start();
+  send({{"a", 1}});
+  platform_.log.clear();
+
+  platform_.dispatch.advance(9s);
+
+  EXPECT_THAT(platform_.log.texts(), ElementsAre(kTimedOut.second, kMessageEntered));
+  EXPECT_THAT(framework_.messages(), IsEmpty());
+  EXPECT_EQ(platform_.statistics.value("link", "dropped: no back-end"), 1U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, ASentMessageIsLoggedAsTheClientGaveIt) {
+  open();
+  platform_.log.clear();
+
+  send({{"sample rate", 48000}}, AudioEventCategory::kToolbox | kPlayback);
+  run();
+
+  const auto sent = framework_.messages().at(0);
+  EXPECT_EQ(sent.category, 4);
+  EXPECT_EQ(sent.type, 1);
+  EXPECT_EQ(sent.payload,
+            (Dictionary{{"sample_rate", 48000}, {"audiotag", "Toolbox_PlaybackStart"}}));
+  EXPECT_THAT(platform_.log.texts(LogLevel::kDebug),
+              ElementsAre("sending message for session owned by 7", kMessageEntered,
+                          "TLMReportingAgent session 1 : message {sample rate = 48000} : category "
+                          "-2147483644 : type 1"));
+  EXPECT_EQ(platform_.log.lines().back().category, "hvrr");
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, AFailureWithAnErrorIsLoggedAndNotRetried) {
+  open();
+  framework_.setOutcome({.sent = false, .error = platform::Error{.description = "no route"}});
+  platform_.log.clear();
+
+  send({{"a", 1}});
+  run();
+
+  EXPECT_THAT(platform_.log.texts(LogLevel::kError), ElementsAre("error sending message no route"));
+  EXPECT_EQ(platform_.log.lines().back().category, "hvrr");
+  EXPECT_EQ(framework_.messages().size(), 1U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, AFailureWithoutAnErrorIsSilent) {
+  open();
+  framework_.setOutcome({.sent = false});
+  platform_.log.clear();
+
+  send({{"a", 1}});
+  run();
+
+  EXPECT_EQ(platform_.log.texts().back(), kMessageEntered);
+  EXPECT_EQ(platform_.statistics.value("link", "failed"), 1U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, ARedundantMessageIsNotSent) {
+  open();
+
+  send({{"a", 1}});
+  send({{"a", 1}});
+  run();
+
+  EXPECT_EQ(framework_.messages().size(), 1U);
+  EXPECT_EQ(platform_.statistics.value("link", "suppressed: redundant"), 1U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, ASessionThatBecameATestSendsNoMore) {
+  open();
+  session_->setServiceType(AudioServiceType::kTest);
+
+  send({{"a", 1}});
+  run();
+
+  EXPECT_THAT(framework_.messages(), IsEmpty());
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, TheReplyComesAtOnceThoughTheLinkFailsLater) {
+  open();
+  framework_.setOutcome({.sent = false, .error = platform::Error{.description = "no route"}});
+  std::vector<std::optional<platform::Error>> replies;
+
+  session_->sendMessage(Dictionary{{"a", 1}}, kPlayback, kStart,
+                        [&replies](const auto& error) { replies.push_back(error); });
+
+  EXPECT_THAT(replies, ElementsAre(std::nullopt));
+  run();
+  EXPECT_EQ(replies.size(), 1U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, BeforeTheStartAMessageIsASingleOne) {
+  send({{"a", 1}});
+  platform_.dispatch.advance(1s);
+
+  const auto sent = framework_.singleMessages();
+  ASSERT_EQ(sent.size(), 1U);
+  EXPECT_EQ(sent[0].payload, (Dictionary{{"a", 1}, {"audiotag", "PlaybackStart"}}));
+  const Dictionary info = framework_.singleMessageInfos().at(0).sessionInfo;
+  EXPECT_EQ(*info.find("TLMReportingSessionInfoSessionID"), platform::Value(-1));
+  EXPECT_EQ(*info.find("TLMReportingSessionInfoClientType"), platform::Value(19));
+}
+
+// Whether it was started counts when it is sent, not when its job runs.
+TEST_F(HVReportingSessionLinkMessagesTest,
+       AMessageOfAStartedSessionIsNoSingleOneThoughTheStopOvertakes) {
+  framework_.answerDiscoveries(Fake::Answering::kBeforeReturning, kServers);
+  session_->start();
+  send({{"a", 1}});
+  session_->stop();
+
+  run();
+
+  EXPECT_EQ(framework_.messages().size(), 2U);  // and the summary event
+  EXPECT_THAT(framework_.singleMessages(), IsEmpty());
+  EXPECT_EQ(platform_.dispatch.delayedJobs(), 0U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, EveryMessageIsAccountedFor) {
+  send({{"a", 0}});  // single
+  run();
+  start();
+  send({{"a", 1}});  // no back-end
+  run();
+  stop();  // with a summary event
+  open();
+  send({{"a", 1}});
+  send({{"a", 1}});  // redundant
+  run();
+  framework_.setOutcome({.sent = false});
+  send({{"a", 2}});  // failed
+  run();
+
+  EXPECT_THAT(
+      platform_.statistics.values("link"),
+      UnorderedElementsAre(Pair("received", 6U), Pair("sent", 1U), Pair("failed", 1U),
+                           Pair("handed on: single message", 1U), Pair("suppressed: redundant", 1U),
+                           Pair("dropped: no back-end", 2U)));
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, WhatWaitsIsChargedToTheClientUntilItWasSent) {
+  const auto account = std::make_shared<ResourceAccount>();
+  session_->chargeTo(account);
+  holdDiscoveries();
+  start();
+
+  for (int count = 0; count < 10; ++count) send({{"a", std::string(1000, 'x')}, {"n", count}});
+  const std::size_t history = (*session_->nestedAggregatedPayloadData())->memorySize();
+  EXPECT_GE(account->use().bytes, history + std::size_t{10} * 1000);
+
+  framework_.answerDiscovery(kServers);
+  run();
+  EXPECT_EQ(account->use().bytes, history);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, RedundantMessagesThatWaitAreChargedToo) {
+  const auto account = std::make_shared<ResourceAccount>();
+  session_->chargeTo(account);
+  holdDiscoveries();
+  start();
+  send({{"a", 1}});
+  const std::size_t before = account->use().bytes;
+
+  for (int count = 0; count < 10; ++count) send({{"a", 1}});
+
+  EXPECT_GE(account->use().bytes, before + std::size_t{10} * sizeof(Dictionary::Entry));
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, WhatATagReplacedIsChargedWhileItWaits) {
+  const auto account = std::make_shared<ResourceAccount>();
+  session_->chargeTo(account);
+  holdDiscoveries();
+  start();
+
+  send({{"audiotag", std::string(100'000, 'x')}});
+
+  EXPECT_GE(account->use().bytes, 100'000U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, WhatWaitsStaysChargedWhenTheSessionIsStopped) {
+  const auto account = std::make_shared<ResourceAccount>();
+  session_->chargeTo(account);
+  holdDiscoveries();
+  start();
+  send({{"a", std::string(1000, 'x')}});
+
+  session_->stop();
+  EXPECT_GE(account->use().bytes, 1000U);
+
+  session_.reset();
+  platform_.dispatch.advance(9s);
+  EXPECT_EQ(account->use().bytes, 0U);
+}
+
+// --- stop ---------------------------------------------------------------------------------------
+
+TEST_F(HVReportingSessionLinkMessagesTest, StopFlushesBehindAllMessages) {
+  open();
+  send({{"a", 1}});
+  platform_.journal.clear();
+
+  stop();
+
+  EXPECT_THAT(frameworkSteps(),
+              ElementsAre("send session 1 4/1", "send session 1 65535/65535", "flush session 1"));
+  EXPECT_TRUE(holdsNothing());
+  EXPECT_EQ(framework_.liveSessions(), 0U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, StopLogsAroundTheFlush) {
+  open();
+  framework_.answerFlushes(Fake::Answering::kWhenTold);
+  linkLines();
+
+  stop();
+  EXPECT_THAT(linkLines(), ElementsAre(kStopEntered));
+
+  framework_.completeFlush();
+  run();
+  EXPECT_THAT(linkLines(), ElementsAre(kClosed));
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, TheSessionOfTheFrameworkStaysUntilItIsFlushed) {
+  open();
+  framework_.answerFlushes(Fake::Answering::kWhenTold);
+
+  stop();
+  platform_.dispatch.advance(1h);
+  EXPECT_NE(session_->tlmReportingSession(), nullptr);
+  EXPECT_TRUE(session_->tlmReportingSessionStarted());
+
+  framework_.completeFlush();
+  run();
+  EXPECT_TRUE(holdsNothing());
+  EXPECT_FALSE(session_->tlmReportingSessionStarted());
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, WhileAFlushIsOutNothingElseOfTheLinkRuns) {
+  open();
+  framework_.answerFlushes(Fake::Answering::kWhenTold);
+  stop();
+  session_->start();
+  send({{"a", 1}});
+  run();
+  EXPECT_EQ(framework_.sessions().size(), 1U);
+
+  framework_.completeFlush();
+  run();
+  EXPECT_EQ(framework_.sessions().size(), 2U);
+  EXPECT_EQ(framework_.messages().back().session, 2U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, AFlushTakesNoSignalOfADiscovery) {
+  holdDiscoveries();
+  start();
+  platform_.dispatch.advance(9s);
+  framework_.answerDiscovery(kServers);  // too late: the signal stays
+  stop();
+  framework_.answerFlushes(Fake::Answering::kWhenTold);
+  holdDiscoveries();
+  start();  // takes the signal and gives up
+  stop();   // has nothing to flush
+  framework_.answerDiscovery(kServers);
+
+  start();
+  EXPECT_EQ(framework_.waitingFlushes(), 0U);
+  EXPECT_EQ(framework_.sessions().size(), 3U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, StopWithoutAFrameworkSessionFlushesNothing) {
+  start();
+  linkLines();
+  platform_.journal.clear();
+
+  stop();
+
+  EXPECT_THAT(frameworkSteps(), IsEmpty());
+  EXPECT_THAT(linkLines(), ElementsAre(kStopEntered, kClosed));
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, StopDuringTheWaitClosesBehindIt) {
+  holdDiscoveries();
+  start();
+  session_->stop();
+  run();
+  linkLines();
+
+  framework_.answerDiscovery(kServers);
+  run();
+
+  EXPECT_THAT(linkLines(), ElementsAre(kList, kContinuing, kStopEntered, kClosed));
+  EXPECT_EQ(frameworkSteps().back(), "flush session 1");
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, ASessionCanBeStartedAgainWithANewFrameworkSession) {
+  open();
+  stop();
+
+  start();
+  send({{"a", 1}});
+  run();
+
+  EXPECT_EQ(framework_.tokens().size(), 2U);
+  EXPECT_EQ(framework_.messages().back().session, 2U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, ASessionThatWaitsDelaysNoOther) {
+  holdDiscoveries();
+  start();
+  framework_.answerDiscoveries(Fake::Answering::kBeforeReturning, kServers);
+  const auto other =
+      std::make_shared<HVReportingSession>(ReporterID{8}, HVReportingSession::ProcessIdentifiers{});
+  other->setTlmReportingEnabled(true);
+
+  other->start();
+  other->sendMessage(Dictionary{{"a", 1}}, kPlayback, kStart, nullptr);
+  run();
+
+  EXPECT_EQ(framework_.messages().size(), 1U);
+  EXPECT_EQ(framework_.messages().at(0).session, 2U);
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, TheLastJobKeepsTheSessionUntilItIsFlushed) {
+  open();
+  framework_.answerFlushes(Fake::Answering::kWhenTold);
+  stop();
+  const std::weak_ptr<HVReportingSession> session = session_;
+  session_.reset();
+  EXPECT_FALSE(session.expired());
+
+  framework_.completeFlush();
+  run();
+
+  EXPECT_TRUE(session.expired());
+}
+
+// Runs under ThreadSanitizer: discovery answers on a thread of the framework.
+TEST_F(HVReportingSessionLinkMessagesTest, DiscoveryMayAnswerOnAnotherThread) {
+  holdDiscoveries();
+  start();
+
+  std::thread([this] { framework_.answerDiscovery(kServers); }).join();
+  run();
+
+  EXPECT_EQ(linkLines().back(), kContinuing);
+}
+
+}  // namespace
+}  // namespace halvox::link_test
