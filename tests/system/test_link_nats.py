@@ -1,0 +1,348 @@
+"""The back-end of the real-time link against real NATS servers, read back by a plain subscriber."""
+
+import subprocess
+import tempfile
+import threading
+import unittest
+from pathlib import Path
+
+from harness import require, wait_for
+from nats import DRIVER, Driver, Server, SilentServer, cluster, free_ports, numbers_of, read_stream
+
+SUBJECT = "halvox.playback_session"
+
+
+def balance(counters):
+    """Received messages whose fate no counter tells."""
+    return counters["received"] - sum(value for name, value in counters.items() if name != "received")
+
+
+class NatsTest(unittest.TestCase):
+    @classmethod
+    def setUpClass(cls):
+        require("nats-server")
+        if not DRIVER.exists():
+            raise unittest.SkipTest("the link to NATS is not in this build")
+
+
+class DeliveryTest(NatsTest):
+    def test_messages_arrive_in_order_none_missing_none_twice(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(7)
+            found, _, servers = driver.found(7)
+            self.assertTrue(found)
+            self.assertIn(server.url, servers)
+            self.assertEqual(driver.send(7, 20_000), (20_000, 0, ""))
+            driver.flush(7)
+            records = read_stream(server.url)
+            counters = driver.end()
+
+            self.assertEqual(numbers_of(records, f"{SUBJECT}.7"), list(range(20_000)))
+            self.assertEqual(len({record["id"] for record in records}), 20_000)
+            self.assertEqual(driver.flushed(f"{SUBJECT}.7"), [(20_000, 0)])
+            self.assertEqual(counters["acknowledged"], 20_000)
+            self.assertEqual(balance(counters), 0)
+
+    def test_a_message_says_where_it_comes_from(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(-3)
+            driver.found(-3)
+            driver.send(-3, 1, 5)
+            driver.flush(-3)
+            message = read_stream(server.url)[0]["message"]
+            driver.end()
+
+            self.assertEqual(message["sessionInfo"]["TLMReportingSessionInfoSessionID"], -3)
+            self.assertIs(message["sessionInfo"]["TLMReportingSessionInfoBatchEvent"], True)
+            self.assertEqual(message["userInfo"]["TLMReportingUserInfoServiceName"], "playback_session")
+            self.assertEqual((message["category"], message["type"]), (4, 1))
+            self.assertEqual(message["payload"]["number"], 5)
+
+    def test_a_session_that_does_not_batch_waits_for_nothing(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(8, batch=False, service="apiusage_session")
+            driver.found(8)
+            driver.send(8, 1000)
+            driver.flush(8)
+            records = wait_for("the messages", lambda: len(all := read_stream(server.url)) == 1000 and all)
+            driver.end()
+
+            self.assertEqual(numbers_of(records, "halvox.apiusage_session.8"), list(range(1000)))
+            self.assertEqual(driver.flushed("halvox.apiusage_session.8"), [])
+
+    def test_a_flush_waits_for_no_other_session(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(1, count=2)
+            driver.found(1)
+            driver.found(2)
+            driver.send(1, 100)
+            driver.send(2, 50)
+            driver.flush(2)
+            driver.flush(1)
+            driver.end()
+
+            self.assertEqual(driver.flushed(f"{SUBJECT}.1"), [(100, 0)])
+            self.assertEqual(driver.flushed(f"{SUBJECT}.2"), [(50, 0)])
+
+    def test_a_single_message_needs_no_session(self):
+        with Server() as server, Driver(server.url) as driver:
+            self.assertEqual(driver.ask("one alarms"), "sent 1 0 ".strip())
+            records = wait_for("the stream", lambda: self._try_read(server))
+            driver.end()
+
+            self.assertEqual([record["subject"] for record in records], ["halvox.alarms.-1"])
+
+    def test_a_service_name_makes_one_token_of_the_subject(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(4, service="a.b*>" + "x" * 3000)
+            driver.found(4)
+            driver.send(4, 1)
+            driver.flush(4)
+            subject = read_stream(server.url)[0]["subject"]
+            driver.end()
+
+            self.assertEqual(subject, "halvox.a_b__" + "x" * (128 - 5) + ".4")
+
+    def test_what_was_taken_goes_out_before_the_end(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(9)
+            driver.found(9)
+            driver.send(9, 5000)
+            counters = driver.end()
+
+            self.assertEqual(numbers_of(read_stream(server.url), f"{SUBJECT}.9"), list(range(5000)))
+            self.assertEqual(counters["acknowledged"], 5000)
+
+    @staticmethod
+    def _try_read(server):
+        try:
+            return read_stream(server.url)
+        except AssertionError:  # the stream is not made yet
+            return []
+
+
+class FailureTest(NatsTest):
+    def test_no_server_at_the_address_is_told_soon_and_tried_again(self):
+        port = free_ports(1)[0]
+        with Driver(f"nats://127.0.0.1:{port}") as driver:
+            driver.start(1)
+            found, seconds, _ = driver.found(1)
+            self.assertFalse(found)
+            self.assertLess(seconds, 9)
+            taken, refused, error = driver.send(1, 3)
+            with Server(port=port):
+                driver.start(2)
+                self.assertTrue(driver.found(2)[0])
+                driver.send(2, 3)
+                driver.flush(2)
+                counters = driver.end()
+
+            self.assertEqual((taken, refused), (0, 3))
+            self.assertIn("no server was reached", error)
+            self.assertEqual(driver.flushed(f"{SUBJECT}.2"), [(3, 0)])
+            self.assertEqual(balance(counters), 0)
+
+    def test_a_silent_server_holds_no_thread_and_no_other_server(self):
+        with SilentServer() as silent, Driver(silent.url) as driver:
+            driver.start(1)
+            wait_for("the attempt", lambda: silent.accepted)
+            before = driver.threads()
+            driver.start(2, count=1000)
+            self.assertEqual(driver.threads(), before)
+            for session in (1, 2, 1001):
+                found, seconds, _ = driver.found(session)
+                self.assertFalse(found)
+                self.assertLess(seconds, 9)
+            self.assertLess(len(silent.accepted), 10)
+            driver.end()
+
+        with SilentServer() as silent, Server() as server:
+            with Driver(silent.url, server.url) as driver:
+                driver.start(1, count=1000)
+                self.assertTrue(driver.found(1000)[0])
+                driver.start(2000)
+                self.assertLess(driver.found(2000)[1], 0.5)
+                driver.send(2000, 10_000)
+                self.assertLess(driver.flush(2000), 5)
+                driver.end()
+                self.assertEqual(driver.flushed(f"{SUBJECT}.2000"), [(10_000, 0)])
+
+    def test_messages_wait_for_a_server_that_comes_back(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(1)
+            driver.found(1)
+            driver.send(1, 10)
+            driver.flush(1)
+            server.kill()
+            taken, refused, _ = driver.send(1, 100, 10)
+            server.start()
+            driver.flush(1)
+            records = read_stream(server.url)
+            counters = driver.end()
+
+            self.assertEqual((taken, refused), (100, 0))
+            numbers = numbers_of(records, f"{SUBJECT}.1")
+            self.assertEqual(numbers, sorted(set(numbers)))
+            self.assertEqual(driver.flushed(f"{SUBJECT}.1")[0], (10, 0))
+            acknowledged, lost = driver.flushed(f"{SUBJECT}.1")[1]
+            self.assertEqual(acknowledged + lost, 100)
+            self.assertGreaterEqual(len(numbers), 10 + acknowledged)
+            self.assertEqual(balance(counters), 0)
+
+    def test_what_finds_no_room_while_the_server_is_away_is_refused(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(1)
+            driver.found(1)
+            server.kill()
+            taken, refused, error = driver.send(1, 150_000)
+            seconds = driver.flush(1)
+            counters = driver.end()
+
+            self.assertGreater(taken, 10_000)
+            self.assertGreater(refused, 0)
+            self.assertIn("no room", error)
+            self.assertLess(seconds, 6)
+            acknowledged, lost = driver.flushed(f"{SUBJECT}.1")[0]
+            self.assertEqual((acknowledged, lost), (0, taken))
+            self.assertEqual(balance(counters), 0)
+
+    def test_a_server_that_stops_reading_holds_no_caller(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(1)
+            driver.found(1)
+            server.process.send_signal(19)
+            try:
+                driver.send(1, 50_000)
+                self.assertLess(driver.flush(1), 6)
+                driver.end()
+            finally:
+                server.process.send_signal(18)
+            self.assertEqual(balance(driver.counters), 0)
+
+
+class ClusterTest(NatsTest):
+    SESSIONS = 100
+    MESSAGES = 1000
+
+    def test_what_a_flush_called_acknowledged_survives_the_server_in_use(self):
+        servers = cluster()
+        try:
+            for server in servers:
+                server.start()
+            with Driver(servers[0].url, extra="replicas = 3") as driver:
+                self._wait_until_ready(driver)
+                killer = threading.Timer(0.0, servers[0].kill)
+                for session in range(1, self.SESSIONS + 1):
+                    driver.start(session)
+                    self.assertTrue(driver.found(session)[0])
+                    driver.send(session, self.MESSAGES)
+                    if session == self.SESSIONS // 2:
+                        killer.start()
+                    driver.flush(session)
+                killer.join()
+                wait_for("the others to take over", lambda: self._is_confirmed(driver))
+                driver.end()
+            records = wait_for("the stream", lambda: self._try_read(servers[1].url), pause=0.5)
+        finally:
+            for server in servers:
+                server.__exit__()
+        self._check(driver, records)
+
+    def _check(self, driver, records):
+        confirmed = 0
+        for session in range(1, self.SESSIONS + 1):
+            numbers = numbers_of(records, f"{SUBJECT}.{session}")
+            (acknowledged, lost), = driver.flushed(f"{SUBJECT}.{session}")
+            self.assertEqual(acknowledged + lost, self.MESSAGES)
+            self.assertGreaterEqual(len(numbers), acknowledged)
+            self.assertEqual(numbers, sorted(set(numbers)))
+            confirmed += acknowledged
+        self.assertEqual(balance(driver.counters), 0)
+        # The kill came when half of the messages were through.
+        self.assertGreaterEqual(confirmed, self.SESSIONS * self.MESSAGES * 2 // 5)
+
+    @staticmethod
+    def _is_confirmed(driver):
+        before = driver.acknowledged()
+        driver.start(200_000)
+        driver.found(200_000)
+        driver.send(200_000, 1)
+        driver.flush(200_000)
+        return driver.acknowledged() > before
+
+    def _wait_until_ready(self, driver):
+        """The cluster chooses who leads before streams can be made."""
+        def ready():
+            driver.start(100_000)
+            return driver.found(100_000)[0]
+        wait_for("a leader", ready)
+
+    @staticmethod
+    def _try_read(url):
+        try:
+            return read_stream(url)
+        except AssertionError:  # no leader for a moment
+            return []
+
+
+class SecurityTest(NatsTest):
+    @classmethod
+    def setUpClass(cls):
+        super().setUpClass()
+        require("openssl")
+
+    def certificate(self):
+        directory = Path(self.enterContext(tempfile.TemporaryDirectory(prefix="halvox-tls-")))
+        subprocess.run(
+            ["openssl", "req", "-x509", "-newkey", "rsa:2048", "-nodes", "-days", "2",
+             "-subj", "/CN=localhost", "-addext", "subjectAltName=DNS:localhost,IP:127.0.0.1",
+             "-keyout", directory / "key.pem", "-out", directory / "cert.pem"],
+            check=True, capture_output=True)
+        return directory / "cert.pem", directory / "key.pem"
+
+    def test_tls_with_the_authority_that_signed(self):
+        certificate, key = self.certificate()
+        tls = f'tls {{ cert_file: "{certificate}", key_file: "{key}" }}'
+        with Server(tls) as server:
+            with Driver(server.url, extra=f'[link.tls]\nca = "{certificate}"') as driver:
+                driver.start(1)
+                self.assertTrue(driver.found(1)[0])
+                driver.send(1, 10)
+                driver.flush(1)
+                driver.end()
+                self.assertEqual(driver.flushed(f"{SUBJECT}.1"), [(10, 0)])
+
+    def test_tls_with_another_authority_is_no_server(self):
+        certificate, key = self.certificate()
+        other, _ = self.certificate()
+        tls = f'tls {{ cert_file: "{certificate}", key_file: "{key}" }}'
+        with Server(tls) as server:
+            with Driver(server.url, extra=f'[link.tls]\nca = "{other}"') as driver:
+                driver.start(1)
+                self.assertFalse(driver.found(1)[0])
+                driver.end()
+                self.assertTrue(any("no server of the link was reached" in line for line in driver.log))
+
+    def test_wrong_credentials_are_no_server(self):
+        with Server('authorization { user: "a", password: "right" }') as server:
+            wrong = server.url.replace("nats://", "nats://a:wrong@")
+            right = server.url.replace("nats://", "nats://a:right@")
+            with Driver(wrong) as driver:
+                driver.start(1)
+                self.assertFalse(driver.found(1)[0])
+                driver.end()
+                self.assertTrue(any("uthoriz" in line for line in driver.log), driver.log)
+            with Driver(right) as driver:
+                driver.start(1)
+                self.assertTrue(driver.found(1)[0])
+                driver.end()
+
+    def test_a_credentials_file_that_is_missing_is_no_server(self):
+        with Server() as server, Driver(server.url, extra='credentials = "/nowhere/user.creds"') as driver:
+            driver.start(1)
+            self.assertFalse(driver.found(1)[0])
+            driver.end()
+
+
+if __name__ == "__main__":
+    unittest.main()
