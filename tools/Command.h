@@ -23,7 +23,7 @@ enum class ExitStatus : int {
   kRefused = 1,       // the service said no
   kBadArguments = 2,  //
   kNoService = 69,    // EX_UNAVAILABLE: nobody answers, the connection was lost, there is no store
-  kCannotWrite = 74,  // EX_IOERR: standard output takes nothing
+  kCannotWrite = 74,  // EX_IOERR: standard output takes nothing, a file cannot be read or changed
   kBadConfiguration = 78,  // EX_CONFIG
 };
 
@@ -90,6 +90,32 @@ struct ShowEvents {
   std::string database{};  // empty: where the service's configuration puts it
 };
 
+// Settings that the service follows while it runs.
+struct Preferences {
+  enum class Action : std::uint8_t { kGet, kSet, kUnset };
+  Action action = Action::kGet;
+  std::string domain{};
+  std::optional<std::string> key{};    // none: all, to get
+  std::optional<std::string> value{};  // to set
+  bool isString = false;               // whatever the value looks like
+  std::string user = "mobile";
+  std::string directory{};  // empty: where the service's configuration puts it
+};
+struct PostNotification {
+  std::string name{};
+  std::string directory{};  // empty: where the service's configuration puts it
+};
+
+// Archives of diagnostics; the file "newest" is the newest of the service's.
+struct ShowSnapshot {
+  std::string file{};
+};
+struct ExtractSnapshot {
+  std::string file{};
+  std::string directory{};  // empty: one named as the archive, in the working directory
+  bool force = false;       // replaces files that are there
+};
+
 // What all commands take.
 struct CommonOptions {
   bool json = false;
@@ -98,7 +124,7 @@ struct CommonOptions {
 };
 
 struct Command {
-  std::variant<Request, RunScript, RunShell, ShowEvents> what;
+  std::variant<Request, RunScript, RunShell, ShowEvents, Preferences, PostNotification> what;
   CommonOptions options;
 };
 

@@ -29,7 +29,7 @@ constexpr const char* kScriptNote =
 
 constexpr const char* kExitStatusNote =
     "Exit status: 0 done, 1 the service said no, 2 bad arguments, 69 no service or no store, "
-    "74 the output cannot be written, 78 bad configuration.";
+    "74 the output or a file cannot be written, 78 bad configuration.";
 
 double secondsSince1970() {
   return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
@@ -55,6 +55,7 @@ class CommandLineParser {
       addConnectionOptions(app_);
       addScripts();
       addEvents();
+      addSettings();
     } else {
       addScriptRequests();
     }
@@ -150,6 +151,8 @@ class CommandLineParser {
   void addScriptRequests();
   void addScripts();
   void addEvents();
+  void addSettings();
+  [[nodiscard]] Preferences makePreferences() const;
   [[nodiscard]] Send makeSend() const;
   static std::string helpOf(const CLI::App& app);
   [[nodiscard]] std::string describe(const CLI::ParseError& error) const;
@@ -171,6 +174,8 @@ class CommandLineParser {
   std::optional<std::chrono::milliseconds> time_;
   RunScript script_;
   ShowEvents events_;
+  Preferences preferences_;
+  PostNotification notification_;
 };
 
 void CommandLineParser::addSessionRequests() {
@@ -337,9 +342,88 @@ void CommandLineParser::addEvents() {
   onRun(events, [this] { return events_; });
 }
 
+void CommandLineParser::addSettings() {
+  using Action = Preferences::Action;
+  auto& preferences =
+      addCommand("preferences", "Show or change settings that the service follows while it runs",
+                 "halvoxctl preferences set com.tarno.halvox device_name Kitchen",
+                 "A set or unset leaves everything else in the file as it is, comments too. Tables "
+                 "with lines of their own cannot be changed so; edit the file instead.\nA VALUE "
+                 "that begins with - comes behind a -- of its own.");
+  preferences.add_option("ACTION", preferences_.action, "get, set or unset")
+      ->required()
+      ->transform(CLI::CheckedTransformer(std::vector<std::pair<std::string, Action>>{
+          {"get", Action::kGet}, {"set", Action::kSet}, {"unset", Action::kUnset}}));
+  preferences.add_option("DOMAIN", preferences_.domain, "A domain, such as com.tarno.halvox")
+      ->required();
+  preferences.add_option("KEY", preferences_.key, "A key; to get all, none");
+  preferences.add_option("VALUE", preferences_.value,
+                         "A TOML value; what is none is taken as a string");
+  preferences.add_flag("--string", preferences_.isString, "Take VALUE as a string in any case");
+  preferences.add_option("--user", preferences_.user, "Whose settings (default: mobile)")
+      ->type_name("USER");
+  preferences
+      .add_option("--directory", preferences_.directory,
+                  "Where the preferences are (default: as the service's configuration says)")
+      ->type_name("DIRECTORY");
+  onRun(preferences, [this] { return makePreferences(); });
+
+  auto& notify = addCommand("notify", "Post a notification to the service",
+                            "halvoxctl notify com.tarno.halvox.reporting");
+  notify.add_option("NAME", notification_.name, "The notification")->required();
+  notify
+      .add_option("--directory", notification_.directory,
+                  "Where the service looks for notifications (default: as its configuration says)")
+      ->type_name("DIRECTORY");
+  onRun(notify, [this] { return notification_; });
+}
+
+Preferences CommandLineParser::makePreferences() const {
+  using Action = Preferences::Action;
+  if (preferences_.action != Action::kGet && !preferences_.key.has_value()) {
+    throw CLI::ValidationError("KEY", "is missing; expected the key to change");
+  }
+  if ((preferences_.action == Action::kSet) != preferences_.value.has_value()) {
+    throw CLI::ValidationError("VALUE", preferences_.value.has_value()
+                                            ? "goes with set only"
+                                            : "is missing; expected what to set the key to");
+  }
+  return preferences_;
+}
+
+void CommandLineParser::addSnapshots() {
+  auto& snapshots = addCommand("snapshots", "Show or unpack what the service captured",
+                               "halvoxctl snapshots show newest");
+  snapshots.require_subcommand(1);
+  const auto addFor = [&](const char* name, const char* summary, const char* example) {
+    CLI::App* app = snapshots.add_subcommand(name, summary);
+    addConnectionOptions(*app);
+    app->footer(std::string("Example:\n  ") + example);
+    app->add_option("FILE", snapshot_.file,
+                    "The archive; \"newest\" is the newest of the service's")
+        ->required();
+    return app;
+  };
+  auto* show = addFor("show", "Show what a snapshot is about and what is in it",
+                      "halvoxctl snapshots show newest --json");
+  onRun(*show, [this] { return ShowSnapshot{snapshot_.file}; });
+
+  auto* extract = addFor("extract", "Unpack a snapshot",
+                         "halvoxctl snapshots extract newest --to /tmp/snapshot");
+  extract
+      ->add_option("--to", snapshot_.directory,
+                   "The directory; made when it is missing (default: one named as the archive)")
+      ->type_name("DIR");
+  extract->add_flag("--force", snapshot_.force, "Replace files that are there");
+  onRun(*extract, [this] { return snapshot_; });
+}
+
 std::string CommandLineParser::helpOf(const CLI::App& app) {
   const auto chosen = app.get_subcommands();
-  return chosen.empty() ? app.help() : chosen.front()->help("halvoxctl");
+  if (chosen.empty()) return app.help();
+  const auto inner = chosen.front()->get_subcommands();
+  if (inner.empty()) return chosen.front()->help("halvoxctl");
+  return inner.front()->help("halvoxctl " + chosen.front()->get_name());
 }
 
 // "halvoxctl send: --type: …": which command, which argument, what is wrong with it.
@@ -348,6 +432,9 @@ std::string CommandLineParser::describe(const CLI::ParseError& error) const {
   const auto chosen = app_.get_subcommands();
   const auto rest = app_.remaining();
   if (!chosen.empty()) prefix += (prefix.empty() ? "" : " ") + chosen.front()->get_name();
+  if (!chosen.empty() && !chosen.front()->get_subcommands().empty()) {
+    prefix += " " + chosen.front()->get_subcommands().front()->get_name();
+  }
   std::string text = prefix.empty() ? "" : prefix + ": ";
   if (chosen.empty() && !rest.empty()) {
     text +=

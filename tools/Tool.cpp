@@ -8,8 +8,11 @@
 #include "tools/CommandLine.h"
 #include "tools/Events.h"
 #include "tools/JsonText.h"
+#include "tools/Notify.h"
+#include "tools/Preferences.h"
 #include "tools/RequestRunner.h"
 #include "tools/Script.h"
+#include "tools/SnapshotFiles.h"
 
 namespace halvox::tools {
 namespace {
@@ -45,8 +48,20 @@ ExitStatus runCommand(const Command& command, const ToolStreams& streams) {
     return runScript({streams.input, "line", streams.isInputTerminal, true}, options,
                      streams.output, streams.errors);
   }
-  return showEvents(std::get<ShowEvents>(command.what),
-                    options.json ? EventForm::kJson : EventForm::kText, streams.output,
+  if (const auto* preferences = std::get_if<Preferences>(&command.what)) {
+    return showOrChangePreferences(*preferences, options.json, streams.output, streams.errors);
+  }
+  if (const auto* notification = std::get_if<PostNotification>(&command.what)) {
+    return postNotification(*notification, streams.errors);
+  }
+  const EventForm form = options.json ? EventForm::kJson : EventForm::kText;
+  if (const auto* show = std::get_if<ShowSnapshot>(&command.what)) {
+    return showSnapshot(*show, form, streams.output, streams.errors);
+  }
+  if (const auto* extract = std::get_if<ExtractSnapshot>(&command.what)) {
+    return extractSnapshot(*extract, form, streams.output, streams.errors);
+  }
+  return showEvents(std::get<ShowEvents>(command.what), form, streams.output,
                     streams.outputDescriptor, streams.errors);
 }
 

@@ -1,0 +1,64 @@
+#include "tools/Notify.h"
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+
+#include "client/TestService.h"
+
+namespace halvox::tools {
+namespace {
+
+class NotifyTest : public testing::Test {
+ protected:
+  ExitStatus post(const std::string& name) {
+    errors_.str("");
+    return postNotification({.name = name, .directory = directory_}, errors_);
+  }
+
+  client::ScratchDirectory scratch_;
+  std::string directory_ = scratch_.path("a/notify");
+  std::ostringstream errors_;
+};
+
+TEST_F(NotifyTest, MakesTheDirectoryAndTheFile) {
+  EXPECT_EQ(post("org.example.changed"), ExitStatus::kDone);
+
+  EXPECT_TRUE(std::filesystem::is_regular_file(directory_ + "/org.example.changed"));
+  EXPECT_EQ(errors_.str(), "");
+}
+
+TEST_F(NotifyTest, TouchesAFileThatIsThereAndLeavesItsContent) {
+  ASSERT_EQ(post("name"), ExitStatus::kDone);
+  const std::string file = directory_ + "/name";
+  std::ofstream(file) << "text";
+  const auto longAgo = std::filesystem::file_time_type::clock::now() - std::chrono::hours(1);
+  std::filesystem::last_write_time(file, longAgo);
+
+  EXPECT_EQ(post("name"), ExitStatus::kDone);
+
+  EXPECT_GT(std::filesystem::last_write_time(file), longAgo + std::chrono::minutes(59));
+  EXPECT_EQ(std::filesystem::file_size(file), 4U);
+}
+
+TEST_F(NotifyTest, NamesThatLeaveTheDirectoryAreBadArguments) {
+  for (const std::string name : {"", "..", "a/b", "/tmp/x"}) {
+    EXPECT_EQ(post(name), ExitStatus::kBadArguments) << name;
+    EXPECT_NE(errors_.str().find("halvoxctl notify: NAME:"), std::string::npos);
+  }
+  EXPECT_FALSE(std::filesystem::exists(directory_));
+}
+
+TEST_F(NotifyTest, WhatIsNoFileIsToldAndBlocksNobody) {
+  ASSERT_EQ(post("other"), ExitStatus::kDone);
+  ASSERT_EQ(::mkfifo((directory_ + "/name").c_str(), 0600), 0);
+
+  EXPECT_EQ(post("name"), ExitStatus::kCannotWrite);
+  EXPECT_NE(errors_.str().find(directory_ + "/name: "), std::string::npos);
+}
+
+}  // namespace
+}  // namespace halvox::tools

@@ -1,0 +1,134 @@
+#include "tools/Preferences.h"
+
+#include <filesystem>
+#include <optional>
+#include <string>
+#include <utility>
+#include <variant>
+
+#include "platform/linux/settings/PreferenceEditing.h"
+#include "platform/linux/settings/PreferenceFile.h"
+#include "platform/linux/settings/PreferenceWriting.h"
+#include "platform/linux/settings/SettingNames.h"
+#include "tools/JsonText.h"
+#include "tools/SettingsDirectory.h"
+
+namespace halvox::tools {
+namespace {
+
+using platform::Value;
+using platform::linux_::Configuration;
+using platform::linux_::PreferenceFileError;
+using platform::linux_::PreferenceValue;
+
+constexpr const char* kPrefix = "halvoxctl preferences: ";
+
+ExitStatus complain(ExitStatus status, const std::string& why, std::ostream& errors) {
+  errors << kPrefix << harmlessText(why) << '\n';
+  return status;
+}
+
+std::string shown(const Value& value, bool json) {
+  if (!json && value.isString()) return harmlessText(value.string());
+  return harmlessJson(toJson(value));
+}
+
+ExitStatus nothingThere(const Preferences& request, std::ostream& errors) {
+  return complain(ExitStatus::kRefused,
+                  platform::linux_::shownName(*request.key) + " is not set in " +
+                      platform::linux_::shownName(request.domain),
+                  errors);
+}
+
+ExitStatus get(const Preferences& request, const std::filesystem::path& file, bool json,
+               std::ostream& out, std::ostream& errors) {
+  const auto content = platform::linux_::readPreferences(file);
+  if (const auto* error = std::get_if<PreferenceFileError>(&content)) {
+    return complain(ExitStatus::kCannotWrite, error->description, errors);
+  }
+  const auto& values = std::get<platform::Dictionary>(content);
+  if (!request.key.has_value()) {
+    if (json) {
+      out << shown(values, json) << '\n';
+    } else {
+      for (const auto& [key, value] : values) {
+        out << harmlessText(key.text()) << " = " << shown(value, json) << '\n';
+      }
+    }
+    return ExitStatus::kDone;
+  }
+  const Value* value = values.find(*request.key);
+  if (value == nullptr) return nothingThere(request, errors);
+  out << shown(*value, json) << '\n';
+  return ExitStatus::kDone;
+}
+
+ExitStatus change(const std::filesystem::path& file, const platform::linux_::PreferenceEdit& edit,
+                  std::ostream& errors) {
+  const auto error = platform::linux_::changePreferenceFile(file, edit);
+  if (error.has_value()) return complain(ExitStatus::kCannotWrite, error->description, errors);
+  return ExitStatus::kDone;
+}
+
+ExitStatus set(const Preferences& request, const std::filesystem::path& file,
+               std::ostream& errors) {
+  auto parsed = platform::linux_::parsePreferenceValue(
+      *request.value, request.isString ? platform::linux_::ValueForm::kString
+                                       : platform::linux_::ValueForm::kTomlOrString);
+  if (const auto* error = std::get_if<PreferenceFileError>(&parsed)) {
+    return complain(ExitStatus::kBadArguments, error->description, errors);
+  }
+  return change(
+      file,
+      [&](std::string_view text, const std::filesystem::path& named) {
+        return withPreference(text, *request.key, std::get<PreferenceValue>(parsed), named);
+      },
+      errors);
+}
+
+ExitStatus unset(const Preferences& request, const std::filesystem::path& file,
+                 std::ostream& errors) {
+  // Without a file nothing is made only to be looked into.
+  std::error_code ignored;
+  if (!std::filesystem::exists(file, ignored)) return nothingThere(request, errors);
+  bool wasThere = true;
+  const ExitStatus status = change(
+      file,
+      [&](std::string_view text, const std::filesystem::path& named) {
+        auto edited = platform::linux_::withoutPreference(text, *request.key, named);
+        const auto* result = std::get_if<std::string>(&edited);
+        wasThere = result == nullptr || *result != text;
+        return edited;
+      },
+      errors);
+  return wasThere ? status : nothingThere(request, errors);
+}
+
+}  // namespace
+
+ExitStatus showOrChangePreferences(const Preferences& request, bool json, std::ostream& out,
+                                   std::ostream& errors) {
+  const auto found = settingsDirectory(request.directory, &Configuration::preferencesDirectory,
+                                       "preferences", errors);
+  if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
+  const auto file = platform::linux_::preferencePath(std::get<std::filesystem::path>(found),
+                                                     request.user, request.domain);
+  if (!file.has_value()) {
+    return complain(ExitStatus::kBadArguments,
+                    "user " + platform::linux_::shownName(request.user) + ", domain " +
+                        platform::linux_::shownName(request.domain) +
+                        ": expected names that a file can have, without \"/\"",
+                    errors);
+  }
+  switch (request.action) {
+    case Preferences::Action::kGet:
+      return get(request, *file, json, out, errors);
+    case Preferences::Action::kSet:
+      return set(request, *file, errors);
+    case Preferences::Action::kUnset:
+      return unset(request, *file, errors);
+  }
+  return ExitStatus::kBadArguments;
+}
+
+}  // namespace halvox::tools
