@@ -1,0 +1,193 @@
+#include "tools/SnapshotFiles.h"
+
+#include <algorithm>
+#include <filesystem>
+#include <iomanip>
+#include <map>
+#include <optional>
+#include <sstream>
+#include <string>
+#include <utility>
+#include <variant>
+#include <vector>
+
+#include "platform/linux/diagnostics/SnapshotDirectory.h"
+#include "platform/linux/diagnostics/SnapshotReader.h"
+#include "platform/linux/runtime/Configuration.h"
+#include "tools/JsonText.h"
+
+namespace halvox::tools {
+namespace {
+
+namespace fs = std::filesystem;
+
+using platform::Value;
+using platform::linux_::ExistingFiles;
+using platform::linux_::SnapshotReadError;
+
+constexpr const char* kSignatureName = "signature.json";
+constexpr const char* kManifestName = "manifest.json";
+
+// Says what is wrong, in the way of the command, and gives the exit status.
+class Complaint {
+ public:
+  Complaint(const char* command, std::ostream& errors) : command_(command), errors_(errors) {}
+  ExitStatus operator()(ExitStatus status, const std::string& what) const {
+    errors_ << "halvoxctl snapshots " << command_ << ": " << harmlessText(what) << '\n';
+    return status;
+  }
+
+ private:
+  const char* command_;
+  std::ostream& errors_;
+};
+
+// The archive that an argument means, or how the run ends without one.
+std::variant<fs::path, ExitStatus> findSnapshot(const std::string& file,
+                                                const Complaint& complain) {
+  if (file != "newest") return fs::path(file);
+  auto loaded = platform::linux_::loadConfiguration();
+  if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
+    return complain(ExitStatus::kBadConfiguration, error->description);
+  }
+  const platform::linux_::SnapshotDirectory directory(
+      std::get<platform::linux_::Configuration>(loaded).storage.directory);
+  const auto all = directory.newestFirst();
+  if (all.empty()) {
+    return complain(ExitStatus::kNoService, "there is no snapshot in " + directory.path().native());
+  }
+  return all.front();
+}
+
+struct Contents {
+  Dictionary signature;
+  Dictionary manifest;
+};
+
+// What a snapshot tells of itself, or what is wrong with it.
+std::variant<Contents, std::string> readContents(const fs::path& file) {
+  auto read = platform::linux_::readSnapshotFiles(file, {kSignatureName, kManifestName});
+  if (auto* error = std::get_if<SnapshotReadError>(&read)) return std::move(error->description);
+  const auto& texts = std::get<std::map<std::string, std::string>>(read);
+  Contents contents;
+  for (const auto& [name, target] : {std::pair(kSignatureName, &contents.signature),
+                                     std::pair(kManifestName, &contents.manifest)}) {
+    const auto text = texts.find(name);
+    if (text == texts.end()) return file.native() + ": it is no snapshot: it has no " + name;
+    auto parsed = parseDictionary(text->second);
+    if (auto* error = std::get_if<ArgumentError>(&parsed)) {
+      return file.native() + ": " + name + " in it: " + error->message;
+    }
+    *target = std::get<Dictionary>(std::move(parsed));
+  }
+  return contents;
+}
+
+std::string textOf(const Dictionary& dictionary, const char* key) {
+  const Value* value = dictionary.find(key);
+  if (value == nullptr) return "unknown";
+  return harmlessText(value->isString() ? std::string(value->string()) : toJson(*value));
+}
+
+std::string secondsOf(const Dictionary& dictionary) {
+  const Value* value = dictionary.find("seconds");
+  std::ostringstream text;
+  text << std::fixed << std::setprecision(3) << (value == nullptr ? 0.0 : value->toDouble())
+       << " s";
+  return text.str();
+}
+
+// "signature.json    180 bytes  0.000 s" or "pw-dump.json  missing: …".
+void printItem(const Dictionary& item, std::size_t width, std::ostream& out) {
+  out << "  " << std::left << std::setw(static_cast<int>(width)) << textOf(item, "name") << "  ";
+  const Value* isCollected = item.find("collected");
+  if (isCollected != nullptr && isCollected->toBool()) {
+    out << std::right << std::setw(10) << textOf(item, "bytes") << " bytes  " << secondsOf(item);
+    if (item.contains("cut")) out << "  (cut)";
+  } else {
+    out << "missing: " << textOf(item, "reason");
+  }
+  out << '\n';
+}
+
+void printText(const fs::path& file, const Contents& contents, std::ostream& out) {
+  out << harmlessText(file.native()) << "\n  taken " << textOf(contents.manifest, "time") << " in "
+      << secondsOf(contents.manifest) << "\n\nSignature\n";
+  std::size_t width = 0;
+  for (const auto& [key, value] : contents.signature) width = std::max(width, key.text().size());
+  for (const auto& [key, value] : contents.signature) {
+    const std::string name(key.text());
+    out << "  " << std::left << std::setw(static_cast<int>(width)) << harmlessText(name) << "  "
+        << textOf(contents.signature, name.c_str()) << '\n';
+  }
+  out << "\nContents\n";
+  const Value* items = contents.manifest.find("items");
+  if (items == nullptr) return;
+  const platform::Array list = items->array();
+  width = 0;
+  for (const Value& item : list) {
+    width = std::max(width, textOf(item.dictionary(), "name").size());
+  }
+  for (const Value& item : list) printItem(item.dictionary(), width, out);
+}
+
+// "20260301T120000Z-haptics-Generic" of the archive's name.
+std::string stemOf(const fs::path& file) {
+  std::string name = file.filename().native();
+  constexpr std::string_view kSuffix = ".tar.zst";
+  if (name.size() > kSuffix.size() && name.ends_with(kSuffix)) {
+    name.resize(name.size() - kSuffix.size());
+  } else {
+    name += ".files";
+  }
+  return name;
+}
+
+}  // namespace
+
+ExitStatus showSnapshot(const ShowSnapshot& request, EventForm form, std::ostream& out,
+                        std::ostream& errors) {
+  const Complaint complain("show", errors);
+  const auto found = findSnapshot(request.file, complain);
+  if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
+  const auto& file = std::get<fs::path>(found);
+  const auto read = readContents(file);
+  if (const auto* error = std::get_if<std::string>(&read)) {
+    return complain(ExitStatus::kBadArguments, *error);
+  }
+  const auto& contents = std::get<Contents>(read);
+  if (form == EventForm::kJson) {
+    out << harmlessJson(toJson(Dictionary{{"file", file.native()},
+                                          {"signature", contents.signature},
+                                          {"manifest", contents.manifest}}))
+        << '\n';
+  } else {
+    printText(file, contents, out);
+  }
+  return ExitStatus::kDone;
+}
+
+ExitStatus extractSnapshot(const ExtractSnapshot& request, EventForm form, std::ostream& out,
+                           std::ostream& errors) {
+  const Complaint complain("extract", errors);
+  const auto found = findSnapshot(request.file, complain);
+  if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
+  const auto& file = std::get<fs::path>(found);
+  const fs::path directory = request.directory.empty() ? stemOf(file) : request.directory;
+  const auto extracted = platform::linux_::extractSnapshot(
+      file, directory, request.force ? ExistingFiles::kReplace : ExistingFiles::kRefuse);
+  if (const auto* error = std::get_if<SnapshotReadError>(&extracted)) {
+    return complain(ExitStatus::kRefused, error->description);
+  }
+  for (const std::string& name : std::get<std::vector<std::string>>(extracted)) {
+    const std::string path = (directory / name).native();
+    if (form == EventForm::kJson) {
+      out << harmlessJson(toJson(Dictionary{{"file", path}})) << '\n';
+    } else {
+      out << harmlessText(path) << '\n';
+    }
+  }
+  return ExitStatus::kDone;
+}
+
+}  // namespace halvox::tools
