@@ -122,10 +122,10 @@ LinuxPlatform::LinuxPlatform(const Configuration& configuration)
       featureFlags_(configuration_.features),
       store_(storeOptions(configuration_), {clock_, statistics_, backpressure_}),
       analytics_(store_, clock_),
+      files_(configuration_.storage.root, statistics_),
       preferenceReader_(configuration_.preferencesDirectory),
       notify_(configuration_.notifyDirectory, preferenceReader_, statistics_),
       preferences_(preferenceReader_, statistics_),
-      files_(configuration_.storage.root, statistics_),
       dispatch_(*log_, statistics_) {}
 
 Services LinuxPlatform::services() {
