@@ -10,6 +10,7 @@
 #include "platform/linux/store/PayloadEncoder.h"
 #include "platform/linux/store/RecordCounters.h"
 #include "platform/linux/store/RecordKind.h"
+#include "platform/linux/store/RecordSpans.h"
 #include "platform/linux/store/StoreLog.h"
 #include "platform/linux/store/WriterQueue.h"
 #include "platform/statistics.h"
@@ -33,10 +34,15 @@ class AnalyticsRecords final : public RecordKind {
   void takeQueued() override;
   [[nodiscard]] bool hasTaken() const override { return next_ < taken_.size(); }
   [[nodiscard]] SqliteCode write(TransactionAllowance& allowance) override;
-  void onCommitted() override;
-  std::uint64_t dropTaken(DropReason reason) override;
-  [[nodiscard]] SqliteCode deleteOldest(bool& found) override;
-  [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) override;
+  void onCommitted(FinishedRecords& finished) override;
+  std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) override;
+  [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time) override {
+    return spans_.oldestTime(time);
+  }
+  [[nodiscard]] SqliteCode deleteOldest(bool& found) override { return spans_.deleteOldest(found); }
+  [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) override {
+    return spans_.deleteOlderThan(time, found);
+  }
 
  private:
   struct Event {
@@ -49,29 +55,13 @@ class AnalyticsRecords final : public RecordKind {
     Statement insertRecord;
     Statement insertName;
     Statement findName;
-    Statement noteSpan;
-    Statement oldestRecord;
-    Statement deleteRecords;
-    Statement deleteEmptySpans;
-    Statement agedSpan;
-    Statement deleteAgedRecords;
-    Statement shortenSpan;
-  };
-  // The times of a run of records; see the schema.
-  struct Span {
-    std::int64_t number = -1;
-    double firstTime = 0;
-    double lastTime = 0;
   };
 
   [[nodiscard]] SqliteCode writeNext(TransactionAllowance& allowance);
   [[nodiscard]] SqliteCode insert(const Event& event, const Event* twin, std::string_view payload);
   [[nodiscard]] SqliteCode identify(EventName& name);
-  [[nodiscard]] SqliteCode noteTime(double time);
-  [[nodiscard]] SqliteCode flushSpan();
-  [[nodiscard]] SqliteCode readNextRecordID(Database& database);
   Dictionary build(std::size_t index);
-  void endTransaction();
+  void endTransaction(FinishedRecords& finished);
 
   EventNames& names_;
   WriterQueue& queue_;
@@ -87,9 +77,7 @@ class AnalyticsRecords final : public RecordKind {
   Dictionary lookedAhead_;  // the payload of the next event, when it was built for comparison
   bool hasLookedAhead_ = false;
   Statements statements_;
-  std::int64_t nextRecordID_ = 1;
-  std::int64_t nextCommittedRecordID_ = 1;
-  Span span_;
+  RecordSpans spans_{"analytics_records", "analytics_spans"};
   // Names that a failed transaction or a lost database had numbered are numbered anew.
   std::uint64_t generation_ = 1;
   std::uint64_t written_ = 0;       // events of the open transaction

@@ -39,7 +39,7 @@ bool isStoreFile(std::string_view name) {
 }  // namespace
 
 std::optional<StoreError> EventFollower::open(const std::filesystem::path& directory,
-                                              const EventFilter& filter) {
+                                              const RecordFilter& filter) {
   directory_ = directory;
   filter_ = filter;
   started_ = false;
@@ -62,6 +62,26 @@ std::optional<StoreError> EventFollower::open(const std::filesystem::path& direc
 }
 
 std::optional<StoreError> EventFollower::deliver(const StoreReader::EventCallback& callback) {
+  return deliverBy([&] {
+    return reader_.forEachEvent(filter_, [&](const StoredEvent& event) {
+      filter_.after = std::max(filter_.after, event.id);
+      callback(event);
+    });
+  });
+}
+
+std::optional<StoreError> EventFollower::deliver(const RecordTable& table,
+                                                 const StoreReader::RecordCallback& callback) {
+  return deliverBy([&] {
+    return reader_.forEachRecord(table, filter_, [&](const StoredRecord& record) {
+      filter_.after = std::max(filter_.after, record.id);
+      callback(record);
+    });
+  });
+}
+
+template <typename Read>
+std::optional<StoreError> EventFollower::deliverBy(Read read) {
   const Change change = readChanges();
   if (change == Change::kDirectoryGone) {
     return StoreError{StoreError::Kind::kMissing,
@@ -77,10 +97,7 @@ std::optional<StoreError> EventFollower::deliver(const StoreReader::EventCallbac
   }
   if (!isOpen) return std::nullopt;
   started_ = true;
-  auto error = reader_.forEachEvent(filter_, [&](const StoredEvent& event) {
-    filter_.after = std::max(filter_.after, event.id);
-    callback(event);
-  });
+  auto error = read();
   filter_.newest.reset();
   return error;
 }

@@ -65,7 +65,7 @@ TEST_F(EventFollowerTest, LosesAndRepeatsNothingUnderLoad) {
 
 TEST_F(EventFollowerTest, AppliesItsFilterToWhatComes) {
   start();
-  ASSERT_EQ(follower.open(options.directory, {.name = "wanted"}), std::nullopt);
+  ASSERT_EQ(follower.open(options.directory, {.names = {"wanted"}}), std::nullopt);
   send(1, "other");
   send(2, "wanted");
   ASSERT_TRUE(follow(1));

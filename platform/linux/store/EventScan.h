@@ -5,6 +5,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/linux/store/RecordScan.h"
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreReader.h"
 
@@ -16,7 +17,7 @@ namespace halvox::platform::linux_ {
 class EventScan {
  public:
   struct Event {
-    StoredEventID id;
+    StoredRecordID id;
     double time;
     std::int64_t nameID;
     std::size_t payload;  // index in Piece::payloads
@@ -26,14 +27,14 @@ class EventScan {
     std::vector<std::string> payloads;
   };
 
-  EventScan(Database& database, const EventFilter& filter)
+  EventScan(Database& database, const RecordFilter& filter)
       : database_(database), filter_(filter), after_(filter.after) {}
 
   // Finds where to begin and to end.
   [[nodiscard]] SqliteCode begin();
   // Reads on. A piece may be empty though more follow.
   [[nodiscard]] SqliteCode next(Piece& piece);
-  [[nodiscard]] bool isAtEnd() const { return first_ > last_; }
+  [[nodiscard]] bool isAtEnd() const { return bounds_.first > bounds_.last; }
 
   [[nodiscard]] std::string_view nameOf(std::int64_t nameID) { return name(nameID).text; }
 
@@ -48,14 +49,12 @@ class EventScan {
   [[nodiscard]] bool readEvent(const Statement& row, int which, Event& event);
   [[nodiscard]] bool passes(const Event& event);
   [[nodiscard]] const Name& name(std::int64_t nameID);
-  [[nodiscard]] SqliteCode readBound(std::string_view sql, double time, std::int64_t& bound);
   [[nodiscard]] SqliteCode skipToNewest(std::uint64_t count);
 
   Database& database_;
-  const EventFilter& filter_;
-  StoredEventID after_;
-  std::int64_t first_ = 1;  // record numbers
-  std::int64_t last_ = 0;
+  const RecordFilter& filter_;
+  StoredRecordID after_;
+  RecordBounds bounds_;
   std::map<std::int64_t, Name> names_;
   Statement read_;
 };

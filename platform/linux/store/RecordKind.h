@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string_view>
 
 #include "platform/linux/store/Sqlite.h"
@@ -25,6 +26,13 @@ struct TransactionAllowance {
   std::int64_t records;
   std::int64_t payloadBytes;
   [[nodiscard]] bool isUsedUp() const { return records <= 0 || payloadBytes <= 0; }
+};
+
+// Records that the writer is done with, for its queue.
+struct FinishedRecords {
+  std::uint64_t written = 0;
+  std::uint64_t writtenBytes = 0;  // their payloads
+  std::uint64_t unwritten = 0;     // dropped before they were written
 };
 
 // One kind of record of the store: its tables, the records of it that wait, and how they are
@@ -52,11 +60,14 @@ class RecordKind {
   // Writes taken records into the open transaction, in order, until none is left or the allowance
   // is used up, which it reduces. After an error dropTaken() follows.
   [[nodiscard]] virtual SqliteCode write(TransactionAllowance& allowance) = 0;
-  // The transaction's records are in the database.
-  virtual void onCommitted() = 0;
+  // The transaction's records are in the database. Adds them to the finished ones.
+  virtual void onCommitted(FinishedRecords& finished) = 0;
   // The transaction failed: forgets its records and those that are taken but not written yet.
-  // Returns how many were dropped.
-  virtual std::uint64_t dropTaken(DropReason reason) = 0;
+  // Adds them to the finished ones and returns how many were dropped.
+  virtual std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) = 0;
+
+  // The time of the oldest record (seconds since 1970); none when there is none.
+  [[nodiscard]] virtual SqliteCode oldestTime(std::optional<double>& time) = 0;
 
   // Delete some records in the open transaction: the oldest, or only such as are older than that
   // (seconds since 1970). Without an error, `found` tells whether there were any; while it is true

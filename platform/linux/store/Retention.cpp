@@ -1,6 +1,7 @@
 #include "platform/linux/store/Retention.h"
 
 #include <algorithm>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -20,6 +21,23 @@ SqliteCode readInteger(Statement& statement, std::uint64_t& value) {
   if (code == SQLITE_ROW) value = static_cast<std::uint64_t>(statement.integer(0));
   statement.reset();
   return code == SQLITE_ROW ? SQLITE_OK : code;
+}
+
+// Deletes of the kind whose oldest record is the oldest: a flood of one kind must not drive out
+// others that are younger than it.
+SqliteCode deleteOldest(std::span<RecordKind* const> kinds, bool& found) {
+  RecordKind* oldest = nullptr;
+  double oldestTime = 0;
+  for (RecordKind* const kind : kinds) {
+    std::optional<double> time;
+    const SqliteCode code = kind->oldestTime(time);
+    if (code != SQLITE_OK) return code;
+    if (!time.has_value() || (oldest != nullptr && *time >= oldestTime)) continue;
+    oldest = kind;
+    oldestTime = *time;
+  }
+  found = false;
+  return oldest == nullptr ? SQLITE_OK : oldest->deleteOldest(found);
 }
 
 // One step of each kind.
@@ -116,9 +134,7 @@ SqliteCode Retention::deleteForSize(std::span<RecordKind* const> kinds, bool& mo
     SqliteCode code = readUse();
     if (code != SQLITE_OK || !isFull()) return code;
     bool found = false;
-    code = stepAll(kinds, found, [](RecordKind& kind, bool& foundOfKind) {
-      return kind.deleteOldest(foundOfKind);
-    });
+    code = deleteOldest(kinds, found);
     if (code != SQLITE_OK || !found) return code;
   }
   more = true;

@@ -9,7 +9,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Keeps the store within its age and its size, by deleting the oldest records in small steps.
+// Keeps the store within its age and its size, by deleting the oldest records, of whatever kind, in
+// small steps.
 // Belongs to the writer's thread. Uses no timer: it is asked after commits, and at the start.
 class Retention {
  public:

@@ -18,6 +18,13 @@ std::string_view Statement::text(int column) const {
           static_cast<std::size_t>(sqlite3_column_bytes(handle_.get(), column))};
 }
 
+std::string_view Statement::bytes(int column) const {
+  const void* bytes = sqlite3_column_blob(handle_.get(), column);
+  if (bytes == nullptr) return {};
+  return {static_cast<const char*>(bytes),
+          static_cast<std::size_t>(sqlite3_column_bytes(handle_.get(), column))};
+}
+
 SqliteCode Database::open(const std::string& file, DatabaseAccess access) {
   const int mode =
       access == DatabaseAccess::kReadOnly ? SQLITE_OPEN_READONLY : SQLITE_OPEN_READWRITE;

@@ -1,7 +1,9 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 
@@ -19,11 +21,16 @@ class Statement {
  public:
   Statement() = default;
 
-  // Texts are not copied: what was bound must live until the statement has run.
+  // Texts and bytes are not copied: what was bound must live until the statement has run.
   void bind(int index, std::int64_t number) { sqlite3_bind_int64(handle_.get(), index, number); }
   void bind(int index, double number) { sqlite3_bind_double(handle_.get(), index, number); }
   void bind(int index, std::string_view text) {
     sqlite3_bind_text64(handle_.get(), index, text.data(), text.size(), SQLITE_STATIC, SQLITE_UTF8);
+  }
+  void bind(int index, std::span<const std::byte> bytes) {
+    // Without an address the library would take no bytes for no value.
+    const void* data = bytes.empty() ? "" : static_cast<const void*>(bytes.data());
+    sqlite3_bind_blob64(handle_.get(), index, data, bytes.size(), SQLITE_STATIC);
   }
   void bindNull(int index) { sqlite3_bind_null(handle_.get(), index); }
 
@@ -44,6 +51,7 @@ class Statement {
     return sqlite3_column_double(handle_.get(), column);
   }
   [[nodiscard]] std::string_view text(int column) const;
+  [[nodiscard]] std::string_view bytes(int column) const;
   [[nodiscard]] int columns() const { return sqlite3_column_count(handle_.get()); }
 
  private:

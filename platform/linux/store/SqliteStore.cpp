@@ -47,6 +47,10 @@ SqliteStore::SqliteStore(const StoreOptions& options, const Environment& environ
       queue_(options.queue, environment.backpressure),
       eventNames_(options.wantedEvents),
       analyticsRecords_(eventNames_, queue_, environment.statistics, sizes_.payloadBytes),
+      issueMetrics_(queue_, environment.statistics, sizes_.payloadBytes),
+      powerEvents_(queue_, environment.statistics, sizes_.payloadBytes),
+      linkMessages_(queue_, environment.statistics, sizes_.payloadBytes),
+      snapshots_(queue_, environment.statistics, sizes_.payloadBytes),
       retention_({.age = std::chrono::days(options.retentionDays),
                   .databaseBytes = sizes_.databaseBytes,
                   .transactionBytes = sizes_.transactionBytes}) {}
@@ -154,7 +158,9 @@ SqliteCode SqliteStore::writeTransaction() {
 }
 
 void SqliteStore::onStored() {
-  for (RecordKind* const kind : kinds_) kind->onCommitted();
+  FinishedRecords finished;
+  for (RecordKind* const kind : kinds_) kind->onCommitted(finished);
+  queue_.finish(finished.written, finished.writtenBytes);
   const std::uint64_t dropped = std::exchange(droppedSinceStored_, 0);
   if (dropped > 0) kLog.notice("storing again; ", dropped, " events were dropped");
 }
@@ -184,7 +190,12 @@ void SqliteStore::fail(SqliteCode code, std::string_view what) {
 }
 
 void SqliteStore::drop(DropReason reason, std::string_view what) {
-  for (RecordKind* const kind : kinds_) droppedSinceStored_ += kind->dropTaken(reason);
+  // Waiting for a locked file must not look like slow writing, or callers would have to wait too.
+  queue_.disregardTime();
+  FinishedRecords finished;
+  for (RecordKind* const kind : kinds_) droppedSinceStored_ += kind->dropTaken(reason, finished);
+  queue_.finish(finished.written, finished.writtenBytes);
+  queue_.finish(finished.unwritten, 0);
   nextRound_ = std::chrono::steady_clock::now() + kRetryTime;
   if (!failureLines_.tryPass()) return;
   kLog.error("", what, "; ", droppedSinceStored_, " events dropped since the last were stored");

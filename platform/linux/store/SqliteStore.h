@@ -18,6 +18,7 @@
 #include "platform/linux/store/StoreError.h"
 #include "platform/linux/store/StoreFiles.h"
 #include "platform/linux/store/StoreOpening.h"
+#include "platform/linux/store/StoreRecords.h"
 #include "platform/linux/store/WriterQueue.h"
 #include "platform/statistics.h"
 
@@ -65,6 +66,10 @@ class SqliteStore {
 
   [[nodiscard]] EventNames& eventNames() { return eventNames_; }
   [[nodiscard]] AnalyticsRecords& analyticsRecords() { return analyticsRecords_; }
+  [[nodiscard]] IssueMetricRecords& issueMetrics() { return issueMetrics_; }
+  [[nodiscard]] PowerEventRecords& powerEvents() { return powerEvents_; }
+  [[nodiscard]] LinkMessageRecords& linkMessages() { return linkMessages_; }
+  [[nodiscard]] SnapshotRecords& snapshots() { return snapshots_; }
   [[nodiscard]] const ClockService& clock() const { return clock_; }
   // Records that wait to be stored. Any thread.
   [[nodiscard]] std::uint64_t waiting() { return queue_.waiting(); }
@@ -95,7 +100,12 @@ class SqliteStore {
   WriterQueue queue_;
   EventNames eventNames_;
   AnalyticsRecords analyticsRecords_;
-  const std::array<RecordKind*, 1> kinds_{&analyticsRecords_};
+  IssueMetricRecords issueMetrics_;
+  PowerEventRecords powerEvents_;
+  LinkMessageRecords linkMessages_;
+  SnapshotRecords snapshots_;
+  const std::array<RecordKind*, 5> kinds_{&analyticsRecords_, &issueMetrics_, &powerEvents_,
+                                          &linkMessages_, &snapshots_};
 
   // The writer's, after open().
   Database database_;

@@ -8,6 +8,7 @@
 #include <sys/stat.h>
 
 #include "platform/linux/store/EventScan.h"
+#include "platform/linux/store/RecordScan.h"
 #include "platform/linux/store/StoreOpening.h"
 #include "platform/linux/store/StoreSchema.h"
 
@@ -85,7 +86,7 @@ SqliteCode StoreReader::openFile() {
   return needsLog && files_->logBytes() == 0 ? attempt(immutableURI(path)) : code;
 }
 
-std::optional<StoreError> StoreReader::forEachEvent(const EventFilter& filter,
+std::optional<StoreError> StoreReader::forEachEvent(const RecordFilter& filter,
                                                     const EventCallback& callback) {
   if (!database_.isOpen()) return StoreError{StoreError::Kind::kMissing, "no store is open"};
   EventScan scan(database_, filter);
@@ -96,6 +97,25 @@ std::optional<StoreError> StoreReader::forEachEvent(const EventFilter& filter,
     for (const EventScan::Event& event : piece.events) {
       callback({event.id, event.time, scan.nameOf(event.nameID), piece.payloads[event.payload]});
     }
+  }
+  if (code != SQLITE_OK) return failure(code);
+  return std::nullopt;
+}
+
+std::optional<StoreError> StoreReader::forEachRecord(const RecordTable& table,
+                                                     const RecordFilter& filter,
+                                                     const RecordCallback& callback) {
+  if (!database_.isOpen()) return StoreError{StoreError::Kind::kMissing, "no store is open"};
+  // Asked each time, because a service may have migrated the store meanwhile.
+  const auto version = database_.queryInteger("PRAGMA user_version");
+  if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
+  if (*version < table.sinceVersion) return std::nullopt;
+  RecordScan scan(database_, table, filter);
+  SqliteCode code = scan.begin();
+  std::vector<StoredRecord> piece;
+  while (code == SQLITE_OK && !scan.isAtEnd()) {
+    code = scan.next(piece);
+    for (const StoredRecord& record : piece) callback(record);
   }
   if (code != SQLITE_OK) return failure(code);
   return std::nullopt;

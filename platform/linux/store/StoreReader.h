@@ -6,31 +6,59 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <variant>
+#include <vector>
 
+#include "platform/linux/store/RecordTables.h"
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreError.h"
 #include "platform/linux/store/StoreFiles.h"
 
 namespace halvox::platform::linux_ {
 
-// The place of an event in the order in which events were stored. Numbers only grow, with gaps.
-using StoredEventID = std::int64_t;
+// The place of a record in the order in which those of its kind were stored. Numbers only grow,
+// with gaps.
+using StoredRecordID = std::int64_t;
 
-// Which events to read; what is not set does not restrict.
-struct EventFilter {
-  std::string name = "*";                 // a glob pattern as fnmatch(3) understands it
+// Only records in whose column stands one of the numbers.
+struct NumberMatch {
+  std::size_t column;  // of the kind's RecordTable
+  std::vector<std::int64_t> numbers;
+};
+
+// Which records to read; what is not set does not restrict.
+struct RecordFilter {
+  // Glob patterns as fnmatch(3) understands them, of which one must match, for the kinds that have
+  // a name.
+  std::vector<std::string> names{};
   std::optional<double> since{};          // seconds since 1970, included
   std::optional<double> until{};          // seconds since 1970, not included
-  StoredEventID after = 0;                // only events stored later than this one
+  StoredRecordID after = 0;               // only records stored later than this one
   std::optional<std::uint64_t> newest{};  // only so many, the newest
+  std::vector<NumberMatch> numbers{};     // for the kinds that have a RecordTable
 };
 
 // An event as it is stored. The views are valid during the callback.
 struct StoredEvent {
-  StoredEventID id;
+  StoredRecordID id;
   double time;  // seconds since 1970
   std::string_view name;
   std::string_view payload;  // JSON text
+};
+
+// A record of another kind: what stands in the columns of its RecordTable, in their order.
+struct StoredRecord {
+  using Field = std::variant<std::int64_t, std::string>;
+  StoredRecordID id;
+  double time;  // seconds since 1970
+  std::vector<Field> fields;
+
+  [[nodiscard]] std::int64_t number(std::size_t column) const {
+    return std::get<std::int64_t>(fields[column]);
+  }
+  [[nodiscard]] const std::string& text(std::size_t column) const {
+    return std::get<std::string>(fields[column]);
+  }
 };
 
 // Reads a store, while a service writes to it or when none runs, and never changes it.
@@ -39,6 +67,7 @@ struct StoredEvent {
 class StoreReader {
  public:
   using EventCallback = std::function<void(const StoredEvent&)>;
+  using RecordCallback = std::function<void(const StoredRecord&)>;
 
   // Opens the store in that directory: kMissing when there is none, kDamaged, kNewerVersion or
   // kCannotOpen. May be called again, after an error or for another directory.
@@ -46,8 +75,12 @@ class StoreReader {
 
   // Calls back for each event that passes the filter, in the order of storing, newest last. Waits
   // for the database at most a second, should it be locked.
-  [[nodiscard]] std::optional<StoreError> forEachEvent(const EventFilter& filter,
+  [[nodiscard]] std::optional<StoreError> forEachEvent(const RecordFilter& filter,
                                                        const EventCallback& callback);
+  // The same for another kind. A store of a version that did not have the kind yet has none.
+  [[nodiscard]] std::optional<StoreError> forEachRecord(const RecordTable& table,
+                                                        const RecordFilter& filter,
+                                                        const RecordCallback& callback);
 
   // True when none is open, or the store's path leads to another database than it did, or to none;
   // then opening again helps, and event numbers may begin anew.

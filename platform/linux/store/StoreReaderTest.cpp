@@ -24,7 +24,7 @@ class StoreReaderTest : public StoreTest {
     ASSERT_TRUE(allIsStored());
   }
 
-  std::vector<std::string> read(const EventFilter& filter) {
+  std::vector<std::string> read(const RecordFilter& filter) {
     StoreReader reader;
     std::vector<std::string> found;
     auto error = reader.open(options.directory);
@@ -69,8 +69,8 @@ TEST_F(StoreReaderTest, GivesTimeAndName) {
 
 TEST_F(StoreReaderTest, FiltersByNamePattern) {
   store1000(6);
-  EXPECT_THAT(read({.name = "o*"}), ElementsAre(numbered(1), numbered(3), numbered(5)));
-  EXPECT_THAT(read({.name = "x*"}), IsEmpty());
+  EXPECT_THAT(read({.names = {"o*"}}), ElementsAre(numbered(1), numbered(3), numbered(5)));
+  EXPECT_THAT(read({.names = {"x*"}}), IsEmpty());
 }
 
 TEST_F(StoreReaderTest, FiltersByTime) {
@@ -102,7 +102,7 @@ TEST_F(StoreReaderTest, FindsEventsByTimeThoughTheClockWasSetBack) {
 TEST_F(StoreReaderTest, GivesTheNewestOnesNewestLast) {
   store1000(3000);
   EXPECT_THAT(read({.newest = 2}), ElementsAre(numbered(2998), numbered(2999)));
-  EXPECT_THAT(read({.name = "even", .newest = 2}), ElementsAre(numbered(2996), numbered(2998)));
+  EXPECT_THAT(read({.names = {"even"}, .newest = 2}), ElementsAre(numbered(2996), numbered(2998)));
   EXPECT_THAT(read({.newest = 10'000}), SizeIs(3000));
   EXPECT_THAT(read({.newest = 0}), IsEmpty());
 }
@@ -113,14 +113,14 @@ TEST_F(StoreReaderTest, GivesOneOfTheTwoEventsOfAMessage) {
   send(7, "second");
   ASSERT_TRUE(allIsStored());
   EXPECT_THAT(read({.newest = 1}), SizeIs(1));
-  EXPECT_THAT(read({.name = "second"}), SizeIs(1));
+  EXPECT_THAT(read({.names = {"second"}}), SizeIs(1));
 }
 
 TEST_F(StoreReaderTest, ReadsOnAfterAnEvent) {
   store1000(5);
   StoreReader reader;
   ASSERT_EQ(reader.open(options.directory), std::nullopt);
-  std::vector<StoredEventID> ids;
+  std::vector<StoredRecordID> ids;
   ASSERT_EQ(reader.forEachEvent({}, [&](const StoredEvent& event) { ids.push_back(event.id); }),
             std::nullopt);
   EXPECT_THAT(read({.after = ids[2]}), ElementsAre(numbered(3), numbered(4)));

@@ -36,8 +36,65 @@ CROSS JOIN event_names
   ON event_names.id = CASE which.twin WHEN 0 THEN record.name_id ELSE record.twin_name_id END;
 )sql";
 
+// The kinds of record that are written as they come, each with its times as above.
+constexpr std::string_view kOtherRecords = R"sql(
+CREATE TABLE issue_metric_records(
+  id INTEGER PRIMARY KEY,
+  time REAL NOT NULL,
+  metric_id INTEGER NOT NULL,
+  message BLOB NOT NULL);
+CREATE TABLE issue_metric_spans(
+  span INTEGER PRIMARY KEY,
+  first_time REAL NOT NULL,
+  last_time REAL NOT NULL);
+CREATE VIEW issue_metrics(time, metric_id, message) AS
+SELECT time, metric_id, message FROM issue_metric_records;
+
+CREATE TABLE power_event_records(
+  id INTEGER PRIMARY KEY,
+  time REAL NOT NULL,
+  category_id INTEGER NOT NULL,
+  event_name TEXT NOT NULL,
+  payload TEXT NOT NULL);
+CREATE TABLE power_event_spans(
+  span INTEGER PRIMARY KEY,
+  first_time REAL NOT NULL,
+  last_time REAL NOT NULL);
+CREATE VIEW power_events(time, category_id, event_name, payload) AS
+SELECT time, category_id, event_name, payload FROM power_event_records;
+
+CREATE TABLE link_message_records(
+  id INTEGER PRIMARY KEY,
+  time REAL NOT NULL,
+  session_id INTEGER NOT NULL,
+  client_name TEXT NOT NULL,
+  service_name TEXT NOT NULL,
+  category INTEGER NOT NULL,
+  type INTEGER NOT NULL,
+  payload TEXT NOT NULL);
+CREATE TABLE link_message_spans(
+  span INTEGER PRIMARY KEY,
+  first_time REAL NOT NULL,
+  last_time REAL NOT NULL);
+CREATE VIEW link_messages(time, session_id, client_name, service_name, category, type, payload) AS
+SELECT time, session_id, client_name, service_name, category, type, payload
+FROM link_message_records;
+
+CREATE TABLE snapshot_records(
+  id INTEGER PRIMARY KEY,
+  time REAL NOT NULL,
+  signature TEXT NOT NULL,
+  path TEXT NOT NULL);
+CREATE TABLE snapshot_spans(
+  span INTEGER PRIMARY KEY,
+  first_time REAL NOT NULL,
+  last_time REAL NOT NULL);
+CREATE VIEW snapshots(time, signature, path) AS
+SELECT time, signature, path FROM snapshot_records;
+)sql";
+
 // Step number n leads from version n to version n + 1. Steps that were released stay as they are.
-constexpr std::array kMigrations{kAnalyticsEvents};
+constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords};
 
 }  // namespace
 

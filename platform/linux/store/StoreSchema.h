@@ -9,7 +9,7 @@ namespace halvox::platform::linux_ {
 
 constexpr std::string_view kStoreFileName = "halvox.db";
 
-// Records whose times one row of analytics_spans sums up: span = record number / this.
+// Records whose times one row of a table of spans sums up: span = record number / this.
 constexpr std::int64_t kRecordsPerSpan = 512;
 
 // The version that this program writes, kept in `PRAGMA user_version`.

@@ -1,0 +1,144 @@
+#include "platform/linux/store/RecordSpans.h"
+
+#include <algorithm>
+#include <string>
+#include <utility>
+
+#include "platform/linux/store/StoreSchema.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// Few, because a single step may hold large payloads.
+constexpr std::int64_t kRecordsPerStep = 64;
+
+// The statement with the tables' names in the places of $records and $spans.
+std::string withTables(std::string_view sql, std::string_view records, std::string_view spans) {
+  std::string result(sql);
+  for (const auto& [place, name] :
+       {std::pair<std::string_view, std::string_view>{"$records", records}, {"$spans", spans}}) {
+    for (std::size_t at = 0; (at = result.find(place, at)) != std::string::npos;) {
+      result.replace(at, place.size(), name);
+      at += name.size();
+    }
+  }
+  return result;
+}
+
+}  // namespace
+
+SqliteCode RecordSpans::prepare(Database& database) {
+  const SqliteCode read = readNext(database);
+  if (read != SQLITE_OK) return read;
+  for (const auto& [statement, sql] :
+       {std::pair<Statement*, std::string_view>{
+            &statements_.noteSpan,
+            "INSERT INTO $spans VALUES (?1, ?2, ?3) ON CONFLICT(span) DO UPDATE SET"
+            " first_time = min(first_time, excluded.first_time),"
+            " last_time = max(last_time, excluded.last_time)"},
+        {&statements_.oldestRecord, "SELECT id, time FROM $records ORDER BY id LIMIT 1"},
+        {&statements_.deleteRecords, "DELETE FROM $records WHERE id BETWEEN ?1 AND ?2"},
+        // The newest span stays though its records are gone: it keeps record numbers growing.
+        {&statements_.deleteEmptySpans,
+         "DELETE FROM $spans WHERE span < ?1 AND span < (SELECT max(span) FROM $spans)"},
+        {&statements_.agedSpan,
+         "SELECT span FROM $spans WHERE first_time < ?1 ORDER BY span LIMIT 1"},
+        {&statements_.deleteAgedRecords,
+         "DELETE FROM $records WHERE id BETWEEN ?1 AND ?2 AND time < ?3"},
+        {&statements_.shortenSpan,
+         "UPDATE $spans SET first_time = max(first_time, ?2) WHERE span = ?1"}}) {
+    const SqliteCode code =
+        database.prepare(withTables(sql, recordsTable_, spansTable_), *statement);
+    if (code != SQLITE_OK) return code;
+  }
+  return SQLITE_OK;
+}
+
+SqliteCode RecordSpans::readNext(Database& database) {
+  Statement statement;
+  SqliteCode code = database.prepare(withTables("SELECT ifnull((SELECT max(id) FROM $records), 0),"
+                                                " ifnull((SELECT max(span) FROM $spans), -1)",
+                                                recordsTable_, spansTable_),
+                                     statement);
+  if (code != SQLITE_OK) return code;
+  code = statement.step();
+  if (code != SQLITE_ROW) return code;
+  const std::int64_t newest = statement.integer(0);
+  const std::int64_t span = statement.integer(1);
+  // When the newest span's records are gone, nobody knows how many of its numbers were given.
+  const bool isUsedUp = span > newest / kRecordsPerSpan || (newest == 0 && span == 0);
+  next_ = nextCommitted_ = isUsedUp ? (span + 1) * kRecordsPerSpan : newest + 1;
+  span_ = {};
+  return SQLITE_OK;
+}
+
+SqliteCode RecordSpans::note(double time) {
+  const std::int64_t number = next_ / kRecordsPerSpan;
+  if (number == span_.number) {
+    span_.firstTime = std::min(span_.firstTime, time);
+    span_.lastTime = std::max(span_.lastTime, time);
+    return SQLITE_OK;
+  }
+  const SqliteCode code = flush();
+  span_ = {number, time, time};
+  return code;
+}
+
+SqliteCode RecordSpans::flush() {
+  if (span_.number < 0) return SQLITE_OK;
+  Statement& statement = statements_.noteSpan;
+  statement.bind(1, span_.number);
+  statement.bind(2, span_.firstTime);
+  statement.bind(3, span_.lastTime);
+  span_ = {};
+  return statement.run();
+}
+
+void RecordSpans::onRolledBack() {
+  next_ = nextCommitted_;
+  span_ = {};
+}
+
+SqliteCode RecordSpans::oldestTime(std::optional<double>& time) {
+  time.reset();
+  const SqliteCode code = statements_.oldestRecord.step();
+  if (code == SQLITE_ROW) time = statements_.oldestRecord.real(1);
+  statements_.oldestRecord.reset();
+  return code == SQLITE_ROW || code == SQLITE_DONE ? SQLITE_OK : code;
+}
+
+SqliteCode RecordSpans::deleteOldest(bool& found) {
+  SqliteCode code = statements_.oldestRecord.step();
+  found = code == SQLITE_ROW;
+  const std::int64_t first = found ? statements_.oldestRecord.integer(0) : 0;
+  statements_.oldestRecord.reset();
+  if (!found) return code == SQLITE_DONE ? SQLITE_OK : code;
+
+  statements_.deleteRecords.bind(1, first);
+  statements_.deleteRecords.bind(2, first + kRecordsPerStep - 1);
+  code = statements_.deleteRecords.run();
+  if (code != SQLITE_OK) return code;
+  statements_.deleteEmptySpans.bind(1, (first + kRecordsPerStep) / kRecordsPerSpan);
+  return statements_.deleteEmptySpans.run();
+}
+
+SqliteCode RecordSpans::deleteOlderThan(double time, bool& found) {
+  statements_.agedSpan.bind(1, time);
+  SqliteCode code = statements_.agedSpan.step();
+  found = code == SQLITE_ROW;
+  const std::int64_t span = found ? statements_.agedSpan.integer(0) : 0;
+  statements_.agedSpan.reset();
+  if (!found) return code == SQLITE_DONE ? SQLITE_OK : code;
+
+  statements_.deleteAgedRecords.bind(1, span * kRecordsPerSpan);
+  statements_.deleteAgedRecords.bind(2, (span + 1) * kRecordsPerSpan - 1);
+  statements_.deleteAgedRecords.bind(3, time);
+  code = statements_.deleteAgedRecords.run();
+  if (code != SQLITE_OK) return code;
+  // So that the span is not found again; it goes with the records after it.
+  statements_.shortenSpan.bind(1, span);
+  statements_.shortenSpan.bind(2, time);
+  return statements_.shortenSpan.run();
+}
+
+}  // namespace halvox::platform::linux_

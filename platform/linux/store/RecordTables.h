@@ -1,0 +1,91 @@
+#pragma once
+
+#include <array>
+#include <cstddef>
+#include <cstdint>
+#include <span>
+#include <string_view>
+
+namespace halvox::platform::linux_ {
+
+enum class ColumnType : std::uint8_t { kInteger, kText, kBytes };
+
+struct RecordColumn {
+  std::string_view name;
+  ColumnType type;
+};
+
+// One kind of record that is written as it comes: the tables that hold it, as the schema makes
+// them, and what is in a record besides its number and its time.
+struct RecordTable {
+  std::string_view records;
+  std::string_view spans;
+  std::span<const RecordColumn> columns;
+  std::size_t nameColumn;     // what patterns of names are for; kNoColumn: nothing
+  std::int64_t sinceVersion;  // of the schema
+  std::string_view piece;     // under which its records are counted
+};
+
+constexpr std::size_t kNoColumn = static_cast<std::size_t>(-1);
+
+// Columns of the tables, as indices in what a record holds.
+enum IssueMetricColumn : std::uint8_t { kMetricID, kMetricMessage };
+enum PowerEventColumn : std::uint8_t { kPowerCategory, kPowerEventName, kPowerPayload };
+enum LinkMessageColumn : std::uint8_t {
+  kLinkSessionID,
+  kLinkClientName,
+  kLinkServiceName,
+  kLinkCategory,
+  kLinkType,
+  kLinkPayload,
+};
+enum SnapshotColumn : std::uint8_t { kSnapshotSignature, kSnapshotPath };
+
+inline constexpr std::array kIssueMetricColumns{
+    RecordColumn{"metric_id", ColumnType::kInteger},
+    RecordColumn{"message", ColumnType::kBytes},
+};
+inline constexpr std::array kPowerEventColumns{
+    RecordColumn{"category_id", ColumnType::kInteger},
+    RecordColumn{"event_name", ColumnType::kText},
+    RecordColumn{"payload", ColumnType::kText},
+};
+inline constexpr std::array kLinkMessageColumns{
+    RecordColumn{"session_id", ColumnType::kInteger},
+    RecordColumn{"client_name", ColumnType::kText},
+    RecordColumn{"service_name", ColumnType::kText},
+    RecordColumn{"category", ColumnType::kInteger},
+    RecordColumn{"type", ColumnType::kInteger},
+    RecordColumn{"payload", ColumnType::kText},
+};
+inline constexpr std::array kSnapshotColumns{
+    RecordColumn{"signature", ColumnType::kText},
+    RecordColumn{"path", ColumnType::kText},
+};
+
+inline constexpr RecordTable kIssueMetrics{.records = "issue_metric_records",
+                                           .spans = "issue_metric_spans",
+                                           .columns = kIssueMetricColumns,
+                                           .nameColumn = kNoColumn,
+                                           .sinceVersion = 2,
+                                           .piece = "metrics"};
+inline constexpr RecordTable kPowerEvents{.records = "power_event_records",
+                                          .spans = "power_event_spans",
+                                          .columns = kPowerEventColumns,
+                                          .nameColumn = kPowerEventName,
+                                          .sinceVersion = 2,
+                                          .piece = "power log"};
+inline constexpr RecordTable kLinkMessages{.records = "link_message_records",
+                                           .spans = "link_message_spans",
+                                           .columns = kLinkMessageColumns,
+                                           .nameColumn = kLinkServiceName,
+                                           .sinceVersion = 2,
+                                           .piece = "link local"};
+inline constexpr RecordTable kSnapshots{.records = "snapshot_records",
+                                        .spans = "snapshot_spans",
+                                        .columns = kSnapshotColumns,
+                                        .nameColumn = kNoColumn,
+                                        .sinceVersion = 2,
+                                        .piece = "snapshots"};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,24 @@
+#pragma once
+
+#include "platform/clock.h"
+#include "platform/linux/store/SqliteStore.h"
+#include "platform/metrics.h"
+
+namespace halvox::platform::linux_ {
+
+// Records metrics in the store, under the time of the call. Any thread may call. Does not own the
+// store and the clock, which must outlive it.
+class SqliteMetricService final : public MetricService {
+ public:
+  SqliteMetricService(SqliteStore& store, const ClockService& clock)
+      : records_(store.issueMetrics()), clock_(clock) {}
+
+  // The message is encoded before this returns.
+  void postIssueMetric(std::uint32_t metricID, const ProtoBase& message) override;
+
+ private:
+  IssueMetricRecords& records_;
+  const ClockService& clock_;
+};
+
+}  // namespace halvox::platform::linux_
