@@ -88,6 +88,7 @@ class ListQueue final : public platform::DispatchQueue {
 class NullSemaphore final : public platform::DispatchSemaphore {
  public:
   void signal() override {}
+  [[noreturn]] void wait() override { std::abort(); }
 };
 
 class ListDispatch final : public platform::DispatchService {

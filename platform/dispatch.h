@@ -26,6 +26,9 @@ class DispatchSemaphore {
  public:
   virtual ~DispatchSemaphore() = default;
   virtual void signal() = 0;
+  // Blocks the calling thread until there is a signal, which is consumed; without a time limit.
+  // Only for what the system means to stand still; a queue's job waits with waitOn().
+  virtual void wait() = 0;
 };
 
 enum class WaitOutcome : std::uint8_t { kSignalled, kTimedOut };

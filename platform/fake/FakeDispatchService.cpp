@@ -10,11 +10,11 @@ namespace {
 // What this thread is running: whether a job at all, and of which queue (null: of the background
 // queue).
 thread_local bool runningJob = false;
-thread_local const DispatchQueue* runningQueue = nullptr;
+thread_local FakeDispatchQueue* runningQueue = nullptr;
 
 class RunningMark {
  public:
-  explicit RunningMark(const DispatchQueue* queue) {
+  explicit RunningMark(FakeDispatchQueue* queue) {
     // Pumping inside a job would run a queue's jobs inside each other, which no real queue does.
     if (runningJob) throw std::logic_error("a job of the fake dispatch service pumped it");
     runningJob = true;
@@ -26,6 +26,25 @@ class RunningMark {
     runningJob = false;
     runningQueue = nullptr;
   }
+};
+
+// While a job stands still, others may run on its thread.
+class StandingMark {
+ public:
+  StandingMark() : wasRunning_(std::exchange(runningJob, false)), queue_(runningQueue) {
+    runningQueue = nullptr;
+  }
+  StandingMark(const StandingMark&) = delete;
+  StandingMark& operator=(const StandingMark&) = delete;
+  ~StandingMark() {
+    runningJob = wasRunning_;
+    runningQueue = queue_;
+  }
+  [[nodiscard]] FakeDispatchQueue* queue() const { return queue_; }
+
+ private:
+  const bool wasRunning_;
+  FakeDispatchQueue* const queue_;
 };
 
 }  // namespace
@@ -49,6 +68,15 @@ void FakeDispatchQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
 }
 
 void FakeDispatchSemaphore::signal() { service_.signal(*this); }
+
+void FakeDispatchSemaphore::wait() {
+  const StandingMark standing;
+  service_.setWaiting(standing.queue(), true);
+  while (!service_.tryTakeSignal(*this)) {
+    if (!service_.runOne()) throw std::logic_error("nobody will signal the semaphore");
+  }
+  service_.setWaiting(standing.queue(), false);
+}
 
 FakeDispatchService::~FakeDispatchService() { clear(); }
 
@@ -221,6 +249,19 @@ void FakeDispatchService::beginWait(Wait wait) {
     *wait.end = now_ + std::min(*wait.end, std::chrono::nanoseconds::max() - now_);
   }
   waits_.push_back(std::move(wait));
+}
+
+bool FakeDispatchService::tryTakeSignal(FakeDispatchSemaphore& semaphore) {
+  const std::lock_guard lock(mutex_);
+  if (semaphore.signals_ == 0) return false;
+  --semaphore.signals_;
+  return true;
+}
+
+void FakeDispatchService::setWaiting(FakeDispatchQueue* queue, bool isWaiting) {
+  if (queue == nullptr) return;
+  const std::lock_guard lock(mutex_);
+  queue->isWaiting_ = isWaiting;
 }
 
 void FakeDispatchService::signal(FakeDispatchSemaphore& semaphore) {

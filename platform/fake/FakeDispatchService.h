@@ -58,6 +58,9 @@ class FakeDispatchSemaphore final : public DispatchSemaphore {
       : service_(service), signals_(signals) {}
 
   void signal() override;
+  // Runs the jobs that may run, but those of the queue whose job waits, until there is a signal;
+  // std::logic_error when none of them signals. May be called by a job.
+  void wait() override;
 
  private:
   friend class FakeDispatchService;
@@ -122,6 +125,8 @@ class FakeDispatchService final : public DispatchService {
   void add(std::shared_ptr<FakeDispatchQueue> queue, JobWeight weight, Job job);
   void beginWait(Wait wait);
   void signal(FakeDispatchSemaphore& semaphore);
+  [[nodiscard]] bool tryTakeSignal(FakeDispatchSemaphore& semaphore);
+  void setWaiting(FakeDispatchQueue* queue, bool isWaiting);
   // Under the mutex: lets the queue go on with `then`, in front of its other jobs.
   void endWait(Wait wait, WaitOutcome outcome);
   [[nodiscard]] Waits::iterator firstToTimeOut();

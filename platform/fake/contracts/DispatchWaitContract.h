@@ -245,11 +245,26 @@ TYPED_TEST_P(DispatchWaitContract, LetsGoOfWhatTheWaitHeldOnceItHasEnded) {
   EXPECT_TRUE(watchedSemaphore.expired());
 }
 
-REGISTER_TYPED_TEST_SUITE_P(
-    DispatchWaitContract, SignalThatIsThereEndsTheWaitAtOnce, SignalThatComesLaterEndsTheWait,
-    WaitWithoutSignalTimesOut, WaitOfNoTimeTakesASignalOrNone, SignalsThatNobodyWaitsForStay,
-    SignalAfterTheTimeOutIsForTheNextWait, JobsOfAWaitingQueueRunInOrderAfterTheEndOfTheWait,
-    EndOfAWaitIsAJobOfItsQueueAndMayWaitAgain, EachSignalEndsOneWaitFirstComeFirstServed,
-    AThousandWaitingQueuesDelayNoOther, LetsGoOfWhatTheWaitHeldOnceItHasEnded);
+TYPED_TEST_P(DispatchWaitContract, AThreadThatBlocksGoesOnAfterASignal) {
+  const auto queue = this->createQueue();
+  const auto semaphore = this->createSemaphore(1);
+  semaphore->wait();  // takes the signal that is there
+  this->addStep(*queue, "before the signal");
+  queue->async(JobWeight::kBrief, [semaphore] { semaphore->signal(); });
+
+  semaphore->wait();
+
+  EXPECT_EQ(this->steps_, typename TestFixture::Steps{"before the signal"});
+}
+
+REGISTER_TYPED_TEST_SUITE_P(DispatchWaitContract, AThreadThatBlocksGoesOnAfterASignal,
+                            SignalThatIsThereEndsTheWaitAtOnce, SignalThatComesLaterEndsTheWait,
+                            WaitWithoutSignalTimesOut, WaitOfNoTimeTakesASignalOrNone,
+                            SignalsThatNobodyWaitsForStay, SignalAfterTheTimeOutIsForTheNextWait,
+                            JobsOfAWaitingQueueRunInOrderAfterTheEndOfTheWait,
+                            EndOfAWaitIsAJobOfItsQueueAndMayWaitAgain,
+                            EachSignalEndsOneWaitFirstComeFirstServed,
+                            AThousandWaitingQueuesDelayNoOther,
+                            LetsGoOfWhatTheWaitHeldOnceItHasEnded);
 
 }  // namespace halvox::platform::contract

@@ -52,11 +52,18 @@ void DispatchWaits::signal(SharedSemaphore& semaphore) {
     if (isStopped_) return;
     if (semaphore.waits_.empty()) {
       ++semaphore.signals_;
+      semaphore.signalled_.notifyOne();
       return;
     }
     wait = take(semaphore, semaphore.waits_.begin());
   }
   goOn(std::move(wait), WaitOutcome::kSignalled);
+}
+
+void DispatchWaits::block(SharedSemaphore& semaphore) {
+  const MutexLock lock(mutex_);
+  while (semaphore.signals_ == 0) semaphore.signalled_.wait(mutex_);
+  --semaphore.signals_;
 }
 
 void DispatchWaits::timeOut(const std::weak_ptr<SharedSemaphore>& weakSemaphore,
@@ -110,5 +117,7 @@ void DispatchWaits::discard() {
 }
 
 void SharedSemaphore::signal() { pool_->waits().signal(*this); }
+
+void SharedSemaphore::wait() { pool_->waits().block(*this); }
 
 }  // namespace halvox::platform::linux_

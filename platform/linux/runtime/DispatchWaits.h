@@ -48,6 +48,8 @@ class DispatchWaits {
              std::optional<std::chrono::nanoseconds> timeout, Then then);
   // Ends the wait that began first, or keeps the signal.
   void signal(SharedSemaphore& semaphore);
+  // Blocks this thread until there is a signal that no wait of a queue took.
+  void block(SharedSemaphore& semaphore);
   // No wait begins or ends from now on.
   void stop();
   // Destroys the waits with what they hold, and the jobs of their queues. After stop(), when no job
@@ -80,6 +82,7 @@ class SharedSemaphore final : public DispatchSemaphore,
       : pool_(std::move(pool)), signals_(signals) {}
 
   void signal() override;
+  void wait() override;
 
  private:
   friend class DispatchWaits;
@@ -88,6 +91,7 @@ class SharedSemaphore final : public DispatchSemaphore,
   // Both under the mutex of the pool's DispatchWaits; never both more than nothing.
   std::uint64_t signals_;
   DispatchWaits::Waits waits_;
+  Condition signalled_;  // a signal was kept
 };
 
 }  // namespace halvox::platform::linux_
