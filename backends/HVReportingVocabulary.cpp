@@ -32,6 +32,11 @@ platform::LogCategory& HVReportingSessionTLMReportingCategory() {
   return category;
 }
 
+platform::LogCategory& HVReportingDriverUtilityCategory() {
+  static platform::LogCategory& category = makeCategory("hvrd");
+  return category;
+}
+
 platform::LogCategory& HVReportingJoulebookCategory() {
   static platform::LogCategory& category = makeCategory("hvrp");
   return category;

@@ -98,6 +98,7 @@ platform::LogCategory& HVReportingClientCategory();
 platform::LogCategory& HVReportingServiceDelegateCategory();
 platform::LogCategory& HVReportingSessionCategory();
 platform::LogCategory& HVReportingSessionTLMReportingCategory();
+platform::LogCategory& HVReportingDriverUtilityCategory();
 platform::LogCategory& HVReportingJoulebookCategory();
 platform::LogCategory& HVReportingZUBLogCategory();
 platform::LogCategory& HVReportingVEKLogCategory();

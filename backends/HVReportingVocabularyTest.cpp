@@ -31,6 +31,7 @@ TEST_F(HVReportingVocabularyTest, LogCategoriesHaveTheirNamesInTheSubsystem) {
   EXPECT_EQ(namesOf(HVReportingServiceDelegateCategory()), "com.tarno.halvox/hvrs");
   EXPECT_EQ(namesOf(HVReportingSessionCategory()), "com.tarno.halvox/hvrr");
   EXPECT_EQ(namesOf(HVReportingSessionTLMReportingCategory()), "com.tarno.halvox/hvri");
+  EXPECT_EQ(namesOf(HVReportingDriverUtilityCategory()), "com.tarno.halvox/hvrd");
   EXPECT_EQ(namesOf(HVReportingJoulebookCategory()), "com.tarno.halvox/hvrp");
   EXPECT_EQ(namesOf(HVReportingZUBLogCategory()), "com.tarno.halvox/hvra");
   EXPECT_EQ(namesOf(HVReportingVEKLogCategory()), "com.tarno.halvox/hvrb");

@@ -41,6 +41,8 @@ std::string kindError(const Value* value, std::string_view expected) {
   std::string text = "expected " + std::string(expected) + ", found ";
   if (value == nullptr) return text += kNothing;
   switch (value->kind()) {
+    case platform::ValueKind::kNone:
+      return text += kNothing;
     case platform::ValueKind::kNumber:
       return text += "a number";
     case platform::ValueKind::kString:
