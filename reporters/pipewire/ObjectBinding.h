@@ -89,4 +89,19 @@ class StreamBinding {
   ObjectBinding binding_;
 };
 
+// The profiler of the server: hands on each of its events, which come many times a second while
+// streams run. Lives only while they are wanted.
+class ProfilerBinding {
+ public:
+  using ProfileHandler = std::function<void(const spa_pod* profile)>;
+
+  ProfilerBinding(pw_registry* registry, std::uint32_t id, ProfileHandler profiled);
+
+ private:
+  static void onProfile(void* data, const spa_pod* profile);
+
+  ProfileHandler profiled_;
+  ObjectBinding binding_;
+};
+
 }  // namespace halvox::pipewire_reporter

@@ -9,10 +9,13 @@
 #include <utility>
 
 #include <fmt/format.h>
+#include <pipewire/extensions/profiler.h>
+#include <pipewire/impl-module.h>
 #include <pipewire/pipewire.h>
 
 #include "reporters/pipewire/ObjectBinding.h"
 #include "reporters/pipewire/ParamDecoder.h"
+#include "reporters/pipewire/ProfileDecoder.h"
 
 namespace halvox::pipewire_reporter {
 namespace {
@@ -78,6 +81,12 @@ class PipeWireSource::Impl final : public StreamListener {
       throw std::runtime_error(fmt::format("cannot set up PipeWire's library: {}",
                                            std::generic_category().message(errno)));
     }
+    // Teaches the library the profiler's messages; without it there is no profiler for us.
+    if (options_.xruns && pw_context_load_module(context_.get(), PW_EXTENSION_MODULE_PROFILER,
+                                                 nullptr, nullptr) == nullptr) {
+      options_.xruns = false;
+      options_.log("cannot tell xruns: PipeWire's profiler module is not installed");
+    }
     connect();
   }
   ~Impl() override {
@@ -93,6 +102,8 @@ class PipeWireSource::Impl final : public StreamListener {
   void addLink(GlobalID id, const Properties& properties);
   void removeGlobal(GlobalID id);
   void clientChanged(GlobalID id);
+  void updateProfiler();
+  void onProfile(const spa_pod* profile);
   [[nodiscard]] Properties fullProperties(const Properties& stream) const;
 
   void onStreamProperties(GlobalID id, const Properties& properties) override;
@@ -127,6 +138,8 @@ class PipeWireSource::Impl final : public StreamListener {
   spa_hook registryHook_{};
   std::unordered_map<GlobalID, Stream> streams_;
   std::unordered_map<GlobalID, std::unique_ptr<ClientBinding>> clients_;
+  std::optional<GlobalID> profilerID_;  // what the server announced
+  std::unique_ptr<ProfilerBinding> profiler_;
 };
 
 void PipeWireSource::Impl::connect() {
@@ -163,6 +176,8 @@ void PipeWireSource::Impl::disconnect() {
   if (core_ == nullptr) {
     return;
   }
+  profiler_.reset();
+  profilerID_.reset();
   streams_.clear();
   clients_.clear();
   spa_hook_remove(&registryHook_);
@@ -192,6 +207,7 @@ void PipeWireSource::Impl::addNode(GlobalID id, const Properties& properties) {
   stream.announced = properties;
   stream.told = false;
   stream.binding = std::make_unique<StreamBinding>(registry_.get(), id, *this);
+  updateProfiler();
 }
 
 void PipeWireSource::Impl::addLink(GlobalID id, const Properties& properties) {
@@ -202,8 +218,28 @@ void PipeWireSource::Impl::addLink(GlobalID id, const Properties& properties) {
 void PipeWireSource::Impl::removeGlobal(GlobalID id) {
   streams_.erase(id);
   clients_.erase(id);
+  if (profilerID_ == id) {
+    profilerID_.reset();
+  }
+  updateProfiler();
   tracker_.linkRemoved(id);
   tracker_.nodeRemoved(id);
+}
+
+// Never from within a callback of the profiler.
+void PipeWireSource::Impl::updateProfiler() {
+  if (!profilerID_.has_value() || streams_.empty()) {
+    profiler_.reset();
+  } else if (profiler_ == nullptr) {
+    profiler_ = std::make_unique<ProfilerBinding>(
+        registry_.get(), *profilerID_, [this](const spa_pod* profile) { onProfile(profile); });
+  }
+}
+
+void PipeWireSource::Impl::onProfile(const spa_pod* profile) {
+  for (const ProfiledCycle& cycle : decodeProfile(profile)) {
+    tracker_.cycleEnded(cycle.time, cycle.length, cycle.late);
+  }
 }
 
 void PipeWireSource::Impl::clientChanged(GlobalID id) {
@@ -294,6 +330,9 @@ void PipeWireSource::Impl::onGlobal(void* data, std::uint32_t id, std::uint32_t 
   } else if (kind == PW_TYPE_INTERFACE_Client) {
     self->clients_[id] = std::make_unique<ClientBinding>(self->registry_.get(), id,
                                                          [self, id] { self->clientChanged(id); });
+  } else if (kind == PW_TYPE_INTERFACE_Profiler && self->options_.xruns) {
+    self->profilerID_ = id;
+    self->updateProfiler();
   }
 }
 

@@ -25,6 +25,9 @@ class PipeWireSource {
     std::string remote;  // the server's socket name; empty: PipeWire's own choice
     // Told lines for a person: what it connects to, loses and cannot follow.
     std::function<void(std::string_view line)> log;
+    // Whether to follow the server's profiler while there are streams, which tells what they miss.
+    // It wakes the process several times a second while streams run.
+    bool xruns = true;
   };
 
   // Throws std::runtime_error when the library cannot be set up at all.

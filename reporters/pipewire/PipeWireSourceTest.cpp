@@ -1,6 +1,7 @@
 #include "reporters/pipewire/PipeWireSource.h"
 
 #include <chrono>
+#include <csignal>
 #include <functional>
 
 #include <gmock/gmock.h>
@@ -28,10 +29,7 @@ class PipeWireSourceTest : public testing::Test {
     ASSERT_TRUE(audio->isReady());
     loop = std::make_unique<MainLoop>();
     pw_loop_enter(loop->handle());
-    source = std::make_unique<PipeWireSource>(
-        loop->handle(), tracker,
-        PipeWireSource::Options{.remote = {},
-                                .log = [this](std::string_view line) { log.emplace_back(line); }});
+    follow({.remote = {}, .log = {}});
   }
   void TearDown() override {
     source.reset();
@@ -40,6 +38,18 @@ class PipeWireSourceTest : public testing::Test {
     }
   }
 
+  // Follows anew, with our log.
+  void follow(PipeWireSource::Options options) {
+    options.log = [this](std::string_view line) { log.emplace_back(line); };
+    source.reset();
+    source = std::make_unique<PipeWireSource>(loop->handle(), tracker, std::move(options));
+  }
+  void iterateFor(std::chrono::seconds time) const {
+    const auto end = steady_clock::now() + time;
+    while (steady_clock::now() < end) {
+      pw_loop_iterate(loop->handle(), 100);
+    }
+  }
   // Runs the loop until that operation has come `count` times, or the deadline.
   [[nodiscard]] bool waitFor(const std::string& operation, long count = 1) const {
     return waitUntil([&] { return std::ranges::count(client.operations(), operation) >= count; });
@@ -137,7 +147,48 @@ TEST_F(PipeWireSourceTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItRe
   EXPECT_TRUE(waitFor("playback-start", 2));
 }
 
-TEST_F(PipeWireSourceTest, SleepsWhileNothingChanges) {
+TEST_F(PipeWireSourceTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
+  const ChildProcess player = play(20);
+  ASSERT_TRUE(waitFor("volume"));
+  iterateFor(std::chrono::seconds(1));
+  ASSERT_THAT(client.operations(), testing::Not(testing::Contains("playback-issue")));
+
+  player.signal(SIGSTOP);
+  const auto stopped = steady_clock::now();
+  iterateFor(std::chrono::seconds(2));
+  player.signal(SIGCONT);
+  const std::chrono::duration<double> pause = steady_clock::now() - stopped;
+  iterateFor(std::chrono::seconds(2));
+
+  double silence = 0;
+  for (const auto& call : client.calls()) {
+    if (call.operation == "playback-issue") {
+      silence += call.dictionary.find(kSilenceKey)->toDouble();
+    }
+  }
+  EXPECT_EQ(client.last("playback-issue").find(kIssueTypeKey)->string(), "xrun");
+  EXPECT_EQ(client.last("playback-issue").find(kNodeKey)->string(), "pw-play");
+  EXPECT_EQ(client.last("playback-issue").find(kIssueClientKey)->string(), "pw-play");
+  EXPECT_NEAR(silence, pause.count(), 0.5);
+  EXPECT_LE(std::ranges::count(client.operations(), "playback-issue"), 4);
+}
+
+TEST_F(PipeWireSourceTest, SleepsWhileThereIsNoStreamThoughThereIsAProfiler) {
+  {
+    const ChildProcess player = play(20);
+    ASSERT_TRUE(waitFor("volume"));
+  }
+  ASSERT_TRUE(waitFor("destroy"));
+  while (pw_loop_iterate(loop->handle(), 500) > 0) {
+  }
+
+  constexpr int kSeconds = 2;
+  EXPECT_EQ(pw_loop_iterate(loop->handle(), kSeconds * 1000), 0);
+}
+
+TEST_F(PipeWireSourceTest, SleepsWhileNothingChangesWithoutXruns) {
+  follow({.remote = {}, .log = {}, .xruns = false});
+
   const ChildProcess player = play(20);
   ASSERT_TRUE(waitFor("volume"));
   // What still comes of the start comes within moments.
@@ -154,10 +205,7 @@ TEST_F(PipeWireSourceTest, WaitsForAPipeWireThatIsNotThere) {
   source.reset();
   log.clear();
 
-  source = std::make_unique<PipeWireSource>(
-      loop->handle(), tracker,
-      PipeWireSource::Options{.remote = "nobody-home",
-                              .log = [this](std::string_view line) { log.emplace_back(line); }});
+  follow({.remote = "nobody-home", .log = {}});
   for (int i = 0; i < 3; ++i) {
     pw_loop_iterate(loop->handle(), 500);
   }

@@ -104,6 +104,8 @@ std::string ChildProcess::readLine() const {
   return line;
 }
 
+void ChildProcess::signal(int number) const { kill(pid_, number); }
+
 int ChildProcess::wait() {
   int status = -1;
   if (pid_ > 0) {

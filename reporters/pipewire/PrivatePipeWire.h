@@ -21,6 +21,7 @@ class ChildProcess {
   void writeLine(const std::string& line) const;
   // The next line of its output; empty when it has ended.
   std::string readLine() const;
+  void signal(int number) const;
   // Waits for its end and returns its exit status.
   int wait();
 

@@ -64,6 +64,8 @@ class RecordingReportingClient final : public ReportingClient {
         {0x08000008, 5, "format"},
         {10, 18, "route"},
         {14, 18, "volume"},
+        {0x08000004, 7, "playback-issue"},
+        {0x08000002, 7, "record-issue"},
     };
     const auto* found = std::ranges::find_if(kNames, [&](const Name& known) {
       return known.category == category && known.type == type;

@@ -22,6 +22,7 @@ inline constexpr Category kCategoryVolume = 14;
 inline constexpr EventType kTypeStart = 1;
 inline constexpr EventType kTypeStop = 2;
 inline constexpr EventType kTypeSetup = 5;
+inline constexpr EventType kTypeIssueDetector = 7;
 inline constexpr EventType kTypeState = 18;
 
 inline constexpr const char* kApplicationKey = "HostApplicationDisplayID";
@@ -36,5 +37,12 @@ inline constexpr const char* kSerialKey = "object_serial";
 inline constexpr const char* kRunKey = "run";
 // The stable names behind `kDevicesKey`, which is meant for people.
 inline constexpr const char* kDeviceNamesKey = "device_node_names";
+
+// An issue: what it is, the node and the application that had it, and what was not heard of it.
+inline constexpr const char* kIssueTypeKey = "issue_type";
+inline constexpr const char* kIssueXrun = "xrun";
+inline constexpr const char* kNodeKey = "node";
+inline constexpr const char* kIssueClientKey = "rtaid_client";
+inline constexpr const char* kSilenceKey = "any_channel_silence_seconds";
 
 }  // namespace halvox::pipewire_reporter

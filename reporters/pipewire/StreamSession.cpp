@@ -8,6 +8,7 @@ namespace halvox::pipewire_reporter {
 namespace {
 
 constexpr std::string_view kRoleProperty = "media.role";
+constexpr std::string_view kNodeProperty = "node.name";
 
 // The entries of `now` that `before` lacks or has otherwise.
 platform::Dictionary changedEntries(const platform::Dictionary& before,
@@ -46,7 +47,8 @@ StreamSession::StreamSession(ReportingClient& client, Identity identity,
       identity_(identity),
       serviceType_(serviceTypeForRole(property(properties, kRoleProperty))),
       configuration_(makeConfiguration(properties)),
-      process_(processName(properties)) {
+      process_(processName(properties)),
+      node_(cleanText(property(properties, kNodeProperty))) {
   client_.createSession(identity_.reporterID);
   client_.setServiceType(identity_.reporterID, serviceType_);
   client_.setConfiguration(identity_.reporterID, configuration_);
@@ -62,6 +64,7 @@ StreamSession::~StreamSession() {
 
 void StreamSession::setProperties(const Properties& properties) {
   process_ = processName(properties);
+  node_ = cleanText(property(properties, kNodeProperty));
   const ServiceType type = serviceTypeForRole(property(properties, kRoleProperty));
   if (type != serviceType_) {
     serviceType_ = type;
@@ -115,6 +118,18 @@ void StreamSession::changeVolume(const VolumeChange& change) {
   }
 }
 
+void StreamSession::addXrun(XrunMeter::Time cycle, XrunMeter::Seconds lost) {
+  if (running_) {
+    xruns_.add(cycle, lost);
+  }
+}
+
+void StreamSession::reportXruns(XrunMeter::Time now) {
+  if (const auto lost = xruns_.takeDue(now)) {
+    sendXrun(*lost);
+  }
+}
+
 void StreamSession::restate() {
   if (!started_) {
     return;
@@ -138,6 +153,9 @@ void StreamSession::beginRun() {
 }
 
 void StreamSession::endRun() {
+  if (const auto lost = xruns_.takeRest()) {
+    sendXrun(*lost);
+  }
   // The volume first, so that its played time ends within the run.
   sendVolumeIfChanged();
   sendRun(kTypeStop);
@@ -171,6 +189,15 @@ void StreamSession::sendVolumeIfChanged() {
         {kPlayingKey, state.playing ? 1 : 0},
         {kVolumeProcessKey, process_}},
        kCategoryVolume, kTypeState);
+}
+
+void StreamSession::sendXrun(XrunMeter::Seconds lost) {
+  platform::Dictionary issue{
+      {kIssueTypeKey, kIssueXrun}, {kNodeKey, node_}, {kSilenceKey, lost.count()}};
+  if (const platform::Value* application = configuration_.find(kApplicationKey)) {
+    issue.set(kIssueClientKey, *application);
+  }
+  send(std::move(issue), category(), kTypeIssueDetector);
 }
 
 void StreamSession::sendRun(EventType type) { send({{kRunKey, run_}}, category(), type); }

@@ -7,13 +7,14 @@
 #include "reporters/pipewire/RouteGraph.h"
 #include "reporters/pipewire/StreamProperties.h"
 #include "reporters/pipewire/StreamValues.h"
+#include "reporters/pipewire/XrunMeter.h"
 
 namespace halvox::pipewire_reporter {
 
 // The reporting session of one stream.
 //
 //   made: session created, typed and configured
-//     └─ first run: session started ─┬─ runs: Start, volume (playing)
+//     └─ first run: session started ─┬─ runs: Start, volume (playing), xruns
 //                                    └─ idles: volume (not playing), Stop
 //   destroyed: as for idling if it runs; session stopped if it was started, then destroyed
 //
@@ -38,6 +39,11 @@ class StreamSession {
   // An empty route is no news: a stream that is being moved has none for a moment.
   void setRoute(const Route& route);
   void changeVolume(const VolumeChange& change);
+  // The stream missed the cycle of that time and length; reported by the next reportXruns() that is
+  // due.
+  void addXrun(XrunMeter::Time cycle, XrunMeter::Seconds lost);
+  // Reports what the stream lost, at most once a second.
+  void reportXruns(XrunMeter::Time now);
   // Says again what holds now; for a service that has lost what it was told.
   void restate();
 
@@ -49,6 +55,7 @@ class StreamSession {
   void sendFormat();
   void sendRoute();
   void sendVolumeIfChanged();
+  void sendXrun(XrunMeter::Seconds lost);
   void sendRun(EventType type);
   void send(platform::Dictionary message, Category category, EventType type);
   [[nodiscard]] Category category() const;
@@ -64,9 +71,11 @@ class StreamSession {
   ServiceType serviceType_;
   platform::Dictionary configuration_;
   std::string process_;
+  std::string node_;
   std::string format_;
   Route route_;
   StreamVolume volume_;
+  XrunMeter xruns_;
   std::optional<VolumeState> sentVolume_;
   bool started_ = false;
   bool running_ = false;

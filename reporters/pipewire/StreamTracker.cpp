@@ -101,6 +101,19 @@ void StreamTracker::streamVolumeChanged(GlobalID id, const VolumeChange& change)
   }
 }
 
+void StreamTracker::cycleEnded(XrunMeter::Time time, XrunMeter::Seconds length,
+                               std::span<const GlobalID> lateNodes) {
+  for (const GlobalID id : lateNodes) {
+    if (StreamSession* session = findStream(id)) {
+      session->addXrun(time, length);
+    }
+  }
+  // Each cycle also brings what was held back before, so no timer is needed.
+  for (auto& [id, entry] : streams_) {
+    entry.session->reportXruns(time);
+  }
+}
+
 StreamSession* StreamTracker::findStream(GlobalID id) {
   const auto found = streams_.find(id);
   return found == streams_.end() ? nullptr : found->second.session.get();

@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -60,6 +61,9 @@ class StreamTracker {
   void streamRunningChanged(GlobalID id, bool running);
   void streamFormatChanged(GlobalID id, const StreamFormat& format);
   void streamVolumeChanged(GlobalID id, const VolumeChange& change);
+  // A driver of the server went through a cycle of that length, which those nodes missed.
+  void cycleEnded(XrunMeter::Time time, XrunMeter::Seconds length,
+                  std::span<const GlobalID> lateNodes);
 
   [[nodiscard]] std::size_t streamCount() const { return streams_.size(); }
   // Streams that got no session: too many, or with a serial that is taken.

@@ -25,6 +25,7 @@ struct Arguments {
   std::string socket;
   std::string remote;
   bool verbose = false;
+  bool noXruns = false;
 };
 
 void logLine(std::string_view line) { fmt::print(stderr, "halvox-pipewire-reporter: {}\n", line); }
@@ -33,6 +34,8 @@ void declareOptions(CLI::App& app, Arguments& arguments) {
   app.add_option("--socket", arguments.socket, "The reporting service's socket")->type_name("PATH");
   app.add_option("--remote", arguments.remote, "The PipeWire server to follow")->type_name("NAME");
   app.add_flag("--verbose", arguments.verbose, "Say each operation and message on standard error");
+  app.add_flag("--no-xruns", arguments.noXruns,
+               "Do not watch for xruns, which wakes several times a second while streams run");
   app.set_version_flag("--version", std::string("halvox-pipewire-reporter " HALVOX_VERSION));
 }
 
@@ -61,8 +64,9 @@ void run(const Arguments& arguments) {
     wasLost = wasLost || !connected;
   });
   {
-    const PipeWireSource source(loop.handle(), tracker,
-                                {.remote = arguments.remote, .log = logLine});
+    const PipeWireSource source(
+        loop.handle(), tracker,
+        {.remote = arguments.remote, .log = logLine, .xruns = !arguments.noXruns});
     loop.run();
   }
   client.flush(kFarewell);

@@ -1,0 +1,91 @@
+#include "reporters/pipewire/ProfileDecoder.h"
+
+#include <optional>
+#include <utility>
+
+#include <spa/param/profiler.h>
+#include <spa/pod/iter.h>
+#include <spa/pod/parser.h>
+
+namespace halvox::pipewire_reporter {
+namespace {
+
+// The stages of a node's work in a cycle, as the profiler tells them. A node that was not even
+// called waits for another one, and that one is late.
+constexpr std::int32_t kCalled = 1;
+constexpr std::int32_t kAwake = 2;
+
+// No device works in longer cycles; what claims to is no clock of audio.
+constexpr std::chrono::duration<double> kLongestCycle{10};
+
+bool readClock(const spa_pod& value, ProfiledCycle& cycle) {
+  std::int32_t flags = 0;
+  std::int32_t id = 0;
+  const char* name = nullptr;
+  std::int64_t time = 0;
+  spa_fraction rate{};
+  std::int64_t position = 0;
+  std::int64_t duration = 0;
+  if (spa_pod_parse_struct(&value,                                                        //
+                           SPA_POD_Int(&flags), SPA_POD_Int(&id), SPA_POD_String(&name),  //
+                           SPA_POD_Long(&time), SPA_POD_Fraction(&rate),                  //
+                           SPA_POD_Long(&position), SPA_POD_Long(&duration)) < 0 ||
+      rate.denom == 0) {
+    return false;
+  }
+  cycle.time = std::chrono::nanoseconds(time);
+  cycle.length =
+      std::chrono::duration<double>(static_cast<double>(duration) * rate.num / rate.denom);
+  return cycle.length.count() > 0 && cycle.length <= kLongestCycle;
+}
+
+// The node's ID when it is late.
+std::optional<std::uint32_t> readLateNode(const spa_pod& value) {
+  std::int32_t id = 0;
+  const char* name = nullptr;
+  std::int64_t previousSignal = 0;
+  std::int64_t signal = 0;
+  std::int64_t awake = 0;
+  std::int64_t finish = 0;
+  std::int32_t status = 0;
+  if (spa_pod_parse_struct(&value,                                   //
+                           SPA_POD_Int(&id), SPA_POD_String(&name),  //
+                           SPA_POD_Long(&previousSignal), SPA_POD_Long(&signal),
+                           SPA_POD_Long(&awake), SPA_POD_Long(&finish), SPA_POD_Int(&status)) < 0 ||
+      (status != kCalled && status != kAwake)) {
+    return std::nullopt;
+  }
+  return static_cast<std::uint32_t>(id);
+}
+
+std::optional<ProfiledCycle> readCycle(const spa_pod* pod) {
+  auto* object = reinterpret_cast<spa_pod_object*>(const_cast<spa_pod*>(pod));
+  ProfiledCycle cycle;
+  bool hasClock = false;
+  spa_pod_prop* prop = nullptr;
+  SPA_POD_OBJECT_FOREACH(object, prop) {
+    if (prop->key == SPA_PROFILER_clock) {
+      hasClock = readClock(prop->value, cycle);
+    } else if (prop->key == SPA_PROFILER_followerBlock) {
+      if (const auto id = readLateNode(prop->value)) cycle.late.push_back(*id);
+    }
+  }
+  return hasClock ? std::optional(std::move(cycle)) : std::nullopt;
+}
+
+}  // namespace
+
+std::vector<ProfiledCycle> decodeProfile(const spa_pod* profile) {
+  std::vector<ProfiledCycle> cycles;
+  if (profile == nullptr || !spa_pod_is_struct(profile)) return cycles;
+  auto* pod = const_cast<spa_pod*>(profile);
+  spa_pod* entry = nullptr;
+  auto* const body = static_cast<spa_pod*>(SPA_POD_BODY(pod));
+  SPA_POD_FOREACH(body, SPA_POD_BODY_SIZE(pod), entry) {
+    if (!spa_pod_is_object_type(entry, SPA_TYPE_OBJECT_Profiler)) continue;
+    if (auto cycle = readCycle(entry)) cycles.push_back(*std::move(cycle));
+  }
+  return cycles;
+}
+
+}  // namespace halvox::pipewire_reporter

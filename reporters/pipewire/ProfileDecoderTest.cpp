@@ -1,0 +1,121 @@
+#include "reporters/pipewire/ProfileDecoder.h"
+
+#include <array>
+#include <vector>
+
+#include <gtest/gtest.h>
+#include <spa/param/profiler.h>
+#include <spa/pod/builder.h>
+#include <spa/pod/parser.h>
+
+namespace halvox::pipewire_reporter {
+namespace {
+
+using std::chrono::nanoseconds;
+
+// Events of the profiler, put together as the server does.
+class ProfileDecoderTest : public testing::Test {
+ protected:
+  struct Follower {
+    int id;
+    int status;
+  };
+  struct Cycle {
+    std::int64_t time = 0;
+    std::int64_t duration = 1024;
+    spa_fraction rate{1, 48000};
+    std::vector<Follower> followers = {};
+  };
+
+  ProfileDecoderTest() { spa_pod_builder_init(&builder_, buffer_.data(), sizeof buffer_); }
+
+  spa_pod* makeProfile(const std::vector<Cycle>& cycles) {
+    spa_pod_frame frame{};
+    spa_pod_builder_push_struct(&builder_, &frame);
+    for (const Cycle& cycle : cycles) addCycle(cycle);
+    return static_cast<spa_pod*>(spa_pod_builder_pop(&builder_, &frame));
+  }
+  void addCycle(const Cycle& cycle) {
+    spa_pod_frame frame{};
+    spa_pod_builder_push_object(&builder_, &frame, SPA_TYPE_OBJECT_Profiler, 0);
+    spa_pod_builder_prop(&builder_, SPA_PROFILER_info, 0);
+    spa_pod_builder_add_struct(&builder_, SPA_POD_Long(1), SPA_POD_Float(0.1F), SPA_POD_Float(0.1F),
+                               SPA_POD_Float(0.1F), SPA_POD_Int(2));
+    spa_pod_builder_prop(&builder_, SPA_PROFILER_clock, 0);
+    spa_pod_builder_add_struct(&builder_, SPA_POD_Int(0), SPA_POD_Int(30), SPA_POD_String("clock"),
+                               SPA_POD_Long(cycle.time), SPA_POD_Fraction(&cycle.rate),
+                               SPA_POD_Long(4711), SPA_POD_Long(cycle.duration), SPA_POD_Long(0),
+                               SPA_POD_Double(1.0), SPA_POD_Long(0));
+    addNode(SPA_PROFILER_driverBlock, {30, 3});
+    for (const Follower& follower : cycle.followers) {
+      addNode(SPA_PROFILER_followerBlock, follower);
+    }
+    spa_pod_builder_pop(&builder_, &frame);
+  }
+  void addNode(std::uint32_t key, const Follower& node) {
+    const spa_fraction latency{1024, 48000};
+    spa_pod_builder_prop(&builder_, key, 0);
+    spa_pod_builder_add_struct(&builder_, SPA_POD_Int(node.id), SPA_POD_String("node"),
+                               SPA_POD_Long(1), SPA_POD_Long(2), SPA_POD_Long(3), SPA_POD_Long(4),
+                               SPA_POD_Int(node.status), SPA_POD_Fraction(&latency));
+  }
+
+  alignas(8) std::array<std::uint8_t, 16384> buffer_{};
+  spa_pod_builder builder_{};
+};
+
+TEST_F(ProfileDecoderTest, ACycleHasTheTimeAndLengthOfItsClock) {
+  const auto cycles =
+      decodeProfile(makeProfile({{.time = 5'000'000'000, .duration = 2048, .rate = {1, 48000}},
+                                 {.time = 5'042'666'666, .duration = 441, .rate = {1, 44100}}}));
+
+  ASSERT_EQ(cycles.size(), 2U);
+  EXPECT_EQ(cycles[0].time, nanoseconds(5'000'000'000));
+  EXPECT_DOUBLE_EQ(cycles[0].length.count(), 2048.0 / 48000);
+  EXPECT_EQ(cycles[1].time, nanoseconds(5'042'666'666));
+  EXPECT_DOUBLE_EQ(cycles[1].length.count(), 0.01);
+}
+
+TEST_F(ProfileDecoderTest, NodesThatWereCalledAndDidNotFinishAreLate) {
+  const auto cycles =
+      decodeProfile(makeProfile({{.followers = {{40, 0}, {41, 1}, {42, 2}, {43, 3}, {44, 9}}}}));
+
+  ASSERT_EQ(cycles.size(), 1U);
+  EXPECT_EQ(cycles[0].late, (std::vector<std::uint32_t>{41, 42}));
+}
+
+TEST_F(ProfileDecoderTest, CyclesOfAnImplausibleLengthAreLeftOut) {
+  const auto cycles = decodeProfile(makeProfile({{.duration = 0},
+                                                 {.duration = -5},
+                                                 {.rate = {1, 0}},
+                                                 {.duration = 48000 * 11},
+                                                 {.duration = 48000}}));
+
+  ASSERT_EQ(cycles.size(), 1U);
+  EXPECT_EQ(cycles[0].length.count(), 1.0);
+}
+
+TEST_F(ProfileDecoderTest, WhatIsNoProfileHasNoCycles) {
+  EXPECT_TRUE(decodeProfile(nullptr).empty());
+  spa_pod_builder_int(&builder_, 5);
+  EXPECT_TRUE(decodeProfile(reinterpret_cast<const spa_pod*>(buffer_.data())).empty());
+}
+
+TEST_F(ProfileDecoderTest, BlocksOfOtherShapesAreLeftOut) {
+  spa_pod_frame outer{};
+  spa_pod_frame inner{};
+  spa_pod_builder_push_struct(&builder_, &outer);
+  spa_pod_builder_int(&builder_, 1);
+  spa_pod_builder_push_object(&builder_, &inner, SPA_TYPE_OBJECT_Profiler, 0);
+  spa_pod_builder_prop(&builder_, SPA_PROFILER_clock, 0);
+  spa_pod_builder_add_struct(&builder_, SPA_POD_Int(0), SPA_POD_Long(1));
+  spa_pod_builder_prop(&builder_, SPA_PROFILER_followerBlock, 0);
+  spa_pod_builder_int(&builder_, 41);
+  spa_pod_builder_pop(&builder_, &inner);
+  auto* profile = static_cast<spa_pod*>(spa_pod_builder_pop(&builder_, &outer));
+
+  EXPECT_TRUE(decodeProfile(profile).empty());
+}
+
+}  // namespace
+}  // namespace halvox::pipewire_reporter
