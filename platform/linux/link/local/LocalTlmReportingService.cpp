@@ -1,0 +1,87 @@
+#include "platform/linux/link/local/LocalTlmReportingService.h"
+
+#include <string>
+#include <utility>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr const char* kBackendName = "local";
+constexpr const char* kErrorDomain = "com.tarno.halvox.link";
+constexpr std::int64_t kStoreClosed = 1;
+
+// A client's configuration can put any value in the place of a name.
+std::string textOf(const Dictionary& info, std::string_view key) {
+  const Value* const value = info.find(key);
+  if (value == nullptr) return {};
+  return value->isString() ? std::string(value->string()) : describe(*value);
+}
+
+std::shared_ptr<const LinkParty> partyOf(const Dictionary& sessionInfo,
+                                         const Dictionary& userInfo) {
+  const Value* const id = sessionInfo.find(kTLMReportingSessionInfoSessionID);
+  return std::make_shared<const LinkParty>(
+      LinkParty{.sessionID = id == nullptr ? 0 : id->toInt64(),
+                .clientName = textOf(userInfo, kTLMReportingUserInfoClientName),
+                .serviceName = textOf(userInfo, kTLMReportingUserInfoServiceName)});
+}
+
+}  // namespace
+
+// What all messages of a session have in common. Immutable.
+class LocalTlmReportingService::LocalSession final : public TLMReportingSession {
+ public:
+  explicit LocalSession(std::shared_ptr<const LinkParty> party) : party_(std::move(party)) {}
+
+  [[nodiscard]] std::string description() const override {
+    return std::string(kBackendName) + " session " + std::to_string(party_->sessionID);
+  }
+  [[nodiscard]] const std::shared_ptr<const LinkParty>& party() const { return party_; }
+
+ private:
+  const std::shared_ptr<const LinkParty> party_;
+};
+
+TLMReportingService::Token LocalTlmReportingService::TLMHierarchyTokenCreate() {
+  const std::uint64_t number = lastToken_.fetch_add(1, std::memory_order_relaxed) + 1;
+  return std::make_shared<TLMSecureHierarchyToken>(std::string(kBackendName) + "-" +
+                                                   std::to_string(number));
+}
+
+TLMReportingService::Session LocalTlmReportingService::TLMReportingCreateSession(
+    const Dictionary& sessionInfo, const Dictionary& userInfo) {
+  return std::make_shared<LocalSession>(partyOf(sessionInfo, userInfo));
+}
+
+void LocalTlmReportingService::TLMReportingStartConfiguration(const Session& /*session*/,
+                                                              BackendsCallback found) {
+  found(Array{kBackendName});
+}
+
+TLMReportingOutcome LocalTlmReportingService::TLMReportingSendMessage(
+    const Session& session, const TLMReportingMessage& message) {
+  return record(static_cast<const LocalSession&>(*session).party(), message);
+}
+
+void LocalTlmReportingService::TLMReportingFlushMessages(const Session& /*session*/,
+                                                         std::function<void()> flushed) {
+  flushed();
+}
+
+TLMReportingOutcome LocalTlmReportingService::TLMReportingSendOneMessage(
+    const Dictionary& sessionInfo, const Dictionary& userInfo, const TLMReportingMessage& message) {
+  return record(partyOf(sessionInfo, userInfo), message);
+}
+
+TLMReportingOutcome LocalTlmReportingService::record(std::shared_ptr<const LinkParty> party,
+                                                     const TLMReportingMessage& message) {
+  const bool taken = records_.add({.time = clock_.currentDate().secondsSince1970,
+                                   .party = std::move(party),
+                                   .category = message.category,
+                                   .type = message.type,
+                                   .payload = message.payload});
+  if (taken) return {.sent = true};
+  return {.sent = false, .error = Error{kErrorDomain, kStoreClosed, "the store is closed"}};
+}
+
+}  // namespace halvox::platform::linux_
