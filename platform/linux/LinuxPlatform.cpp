@@ -5,6 +5,7 @@
 
 #include <sysexits.h>
 
+#include "platform/linux/drivers/ConfiguredSources.h"
 #include "platform/log.h"
 
 namespace halvox::platform::linux_ {
@@ -126,6 +127,7 @@ LinuxPlatform::LinuxPlatform(const Configuration& configuration)
       preferenceReader_(configuration_.preferencesDirectory),
       notify_(configuration_.notifyDirectory, preferenceReader_, statistics_),
       preferences_(preferenceReader_, statistics_),
+      ioReport_(makeDriverSources(configuration_.drivers), statistics_),
       dispatch_(*log_, statistics_) {}
 
 Services LinuxPlatform::services() {
@@ -157,6 +159,7 @@ std::optional<StartFailure> LinuxPlatform::open() {
   if (const auto error = store_.open()) {
     return StartFailure{exitStatus(error->kind), error->description};
   }
+  ioReport_.open();
   if (const auto error = connections_.open()) {
     return StartFailure{exitStatus(error->kind), error->description};
   }

@@ -6,6 +6,7 @@
 
 #include "platform/fake/AbsentServices.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
+#include "platform/linux/drivers/LinuxIOReportService.h"
 #include "platform/linux/files/RootedFileService.h"
 #include "platform/linux/runtime/AsioDispatchService.h"
 #include "platform/linux/runtime/Backpressure.h"
@@ -78,7 +79,7 @@ class LinuxPlatform {
   AbsentPowerLog powerLog_;
   TomlPreferenceService preferences_;
   AbsentTlmReporting tlmReporting_;
-  AbsentIOReport ioReport_;
+  LinuxIOReportService ioReport_;
   AbsentKtrace ktrace_;
   AbsentPerformanceTraces performanceTraces_;
   AbsentPropertyLists propertyLists_;

@@ -62,9 +62,13 @@ class GroupSubscription final : public IOReportSubscription {};
 
 std::shared_ptr<const DriverSamples> sample(
     const std::vector<std::unique_ptr<SourceReader>>& readers, GroupSelection& group) {
+  std::vector<SourceReader::Asked> asked;
+  asked.reserve(readers.size());
+  for (const auto& reader : readers) asked.push_back(reader->ask());
+  const auto deadline = SourceReader::Clock::now() + SourceReader::kLongestWait;
   std::vector<DriverSamples::Part> parts;
   for (std::size_t source = 0; source < readers.size(); ++source) {
-    auto reading = readers[source]->read();
+    auto reading = readers[source]->take(std::move(asked[source]), deadline);
     if (reading == nullptr) continue;
     DriverSamples::Part part = group.select(source, std::move(reading));
     if (!part.selection->empty()) parts.push_back(std::move(part));
@@ -88,7 +92,8 @@ LinuxIOReportService::LinuxIOReportService(std::vector<std::unique_ptr<DriverSou
 LinuxIOReportService::~LinuxIOReportService() = default;
 
 void LinuxIOReportService::open() {
-  for (const auto& reader : readers_) reader->open();
+  for (const auto& reader : readers_) reader->startOpening();
+  for (const auto& reader : readers_) reader->waitUntilOpen();
 }
 
 IOReportService::Channels LinuxIOReportService::IOReportCopyChannelsInGroup(

@@ -12,8 +12,8 @@ namespace halvox::platform::linux_ {
 
 // What the kernel, the sound server and other daemons count, as driver channels. A subscription is
 // to a group, not to the channels that are there when it is made: channels that appear later count
-// from zero. No reading holds the caller longer than SourceReader::kLongestWait for each source;
-// what is late is left out.
+// from zero. No reading holds the caller longer than SourceReader::kLongestWait, all sources
+// together; what is late is left out.
 //
 // Any thread may call. Owns the sources and their threads, which sleep while nobody asks.
 class LinuxIOReportService final : public IOReportService {
@@ -22,7 +22,8 @@ class LinuxIOReportService final : public IOReportService {
                        StatisticsService& statistics);
   ~LinuxIOReportService() override;
 
-  // Opens all sources at once and waits until each has, or has taken too long.
+  // Starts the threads, which open all sources at once, and waits until each has, or has taken too
+  // long. Once, before all else, when the services are installed.
   void open();
 
   Channels IOReportCopyChannelsInGroup(Name group, Name subGroup,

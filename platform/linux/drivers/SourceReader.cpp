@@ -21,8 +21,7 @@ SourceReader::SourceReader(std::unique_ptr<DriverSource> source, StatisticsServi
     : source_(std::move(source)),
       received_(statistics.counter(pieceOf(*source_), "readings asked for")),
       given_(statistics.counter(pieceOf(*source_), "readings given")),
-      late_(statistics.counter(pieceOf(*source_), "left out: late")),
-      thread_([this] { run(); }) {}
+      late_(statistics.counter(pieceOf(*source_), "left out: late")) {}
 
 SourceReader::~SourceReader() {
   {
@@ -30,25 +29,41 @@ SourceReader::~SourceReader() {
     isEnding_ = true;
   }
   wanted_.notifyAll();
-  thread_.join();
+  if (thread_.joinable()) thread_.join();
 }
 
-void SourceReader::open() {
+void SourceReader::startOpening() {
+  thread_ = std::thread([this] { run(); });
   const MutexLock lock(mutex_);
-  (void)waitForReading(kLongestOpening);
+  opening_ = want();
 }
 
-std::shared_ptr<const Reading> SourceReader::read() {
+void SourceReader::waitUntilOpen() {
+  const MutexLock lock(mutex_);
+  (void)waitFor(opening_, Clock::now() + kLongestOpening);
+}
+
+SourceReader::Asked SourceReader::ask() {
   received_.add();
-  ReadingPointer reading;
+  const MutexLock lock(mutex_);
+  if (Clock::now() - newestTime_ < kMoment) {
+    if (ReadingPointer newest = newest_.lock()) return {.reading = std::move(newest)};
+  }
+  // A source that is late is read all the same, to see whether it has come round.
+  if (isLate_) {
+    if (!std::exchange(isWanted_, true)) wanted_.notifyAll();
+    return {};
+  }
+  return {.reading = nullptr, .number = want(), .isWaiting = true};
+}
+
+std::shared_ptr<const Reading> SourceReader::take(Asked asked, Clock::time_point deadline) {
+  ReadingPointer reading = std::move(asked.reading);
   bool isFirstLate = false;
-  {
+  if (asked.isWaiting) {
     const MutexLock lock(mutex_);
-    if (Clock::now() - newestTime_ < kMoment) reading = newest_.lock();
-    // Nobody waits for a source that was waited for in vain until it has come round.
-    if (reading == nullptr && !(isLate_ && isWanted_)) reading = waitForReading(kLongestWait);
-    isFirstLate = reading == nullptr && !std::exchange(isLate_, reading == nullptr);
-    if (reading != nullptr) isLate_ = false;
+    reading = waitFor(asked.number, deadline);
+    isFirstLate = reading == nullptr && !std::exchange(isLate_, true);
   }
   (reading == nullptr ? late_ : given_).add();
   if (isFirstLate) {
@@ -58,11 +73,17 @@ std::shared_ptr<const Reading> SourceReader::read() {
   return reading;
 }
 
-SourceReader::ReadingPointer SourceReader::waitForReading(std::chrono::milliseconds longest) {
-  const Clock::time_point deadline = Clock::now() + longest;
-  const std::uint64_t number = numberMade_;
+// Has a reading made, unless one is being made, and promises to wait for it; returns how many there
+// were before it.
+std::uint64_t SourceReader::want() {
   if (!std::exchange(isWanted_, true)) wanted_.notifyAll();
   ++waiting_;
+  return numberMade_;
+}
+
+// Null when it is late.
+SourceReader::ReadingPointer SourceReader::waitFor(std::uint64_t number,
+                                                   Clock::time_point deadline) {
   bool inTime = true;
   while (numberMade_ == number && inTime) inTime = made_.waitUntil(mutex_, deadline);
   ReadingPointer reading = numberMade_ == number ? nullptr : handedOver_;
@@ -77,9 +98,11 @@ void SourceReader::run() {
     while (!isWanted_ && !isEnding_) wanted_.wait(mutex_);
     if (isEnding_) break;
     mutex_.unlock();
+    const Clock::time_point start = Clock::now();
     ReadingPointer reading = source_->read();
     const Clock::time_point now = Clock::now();
     mutex_.lock();
+    if (now - start <= kLongestWait) isLate_ = false;
     isWanted_ = false;
     ++numberMade_;
     newest_ = reading;

@@ -28,30 +28,42 @@ class SourceReader {
   SourceReader& operator=(const SourceReader&) = delete;
   ~SourceReader();
 
-  // Opens the source and waits until it has, or has taken too long.
-  void open();
-  // The source's reading of this moment; null, with a line in the log once in a row, when it does
-  // not come in time. While the source is late nobody waits for it.
-  [[nodiscard]] std::shared_ptr<const Reading> read();
+  // Begins to open the source; then waits until it has, or has taken too long. Once each, in this
+  // order. Before it, every reading is late.
+  void startOpening();
+  void waitUntilOpen();
+  // What somebody asked for; to be taken by him, once.
+  struct Asked {
+    std::shared_ptr<const Reading> reading{};  // there already
+    std::uint64_t number = 0;
+    bool isWaiting = false;
+  };
+  // Has the source begin with the reading of this moment, so that several can be at it at once.
+  [[nodiscard]] Asked ask();
+  // The reading that was asked for; null, with a line in the log once in a row, when it does not
+  // come before the deadline. A source that was late once is read, but nobody waits for it before a
+  // reading of it took no longer than allowed.
+  [[nodiscard]] std::shared_ptr<const Reading> take(Asked asked, Clock::time_point deadline);
 
  private:
   using ReadingPointer = std::shared_ptr<const Reading>;
 
   void run();
-  // Asks for a reading, if none is being made, and waits for it; null when it is late.
-  [[nodiscard]] ReadingPointer waitForReading(std::chrono::milliseconds longest)
+  [[nodiscard]] std::uint64_t want() HALVOX_REQUIRES(mutex_);
+  [[nodiscard]] ReadingPointer waitFor(std::uint64_t number, Clock::time_point deadline)
       HALVOX_REQUIRES(mutex_);
 
   const std::unique_ptr<DriverSource> source_;
   Counter& received_;
   Counter& given_;
   Counter& late_;
+  std::uint64_t opening_ = 0;  // of the thread that opens
   Mutex mutex_;
   Condition wanted_;
   Condition made_;
   bool isWanted_ HALVOX_GUARDED_BY(mutex_) = false;
   bool isEnding_ HALVOX_GUARDED_BY(mutex_) = false;
-  bool isLate_ HALVOX_GUARDED_BY(mutex_) = false;  // told already
+  bool isLate_ HALVOX_GUARDED_BY(mutex_) = false;  // told, and not come round yet
   std::uint64_t numberMade_ HALVOX_GUARDED_BY(mutex_) = 0;
   int waiting_ HALVOX_GUARDED_BY(mutex_) = 0;
   // Held only while somebody waits for it: a source looks at who holds its readings.

@@ -196,19 +196,15 @@ void readDirectory(TableReader table, std::filesystem::path& directory) {
 void setDefaultDirectories(Configuration& configuration) {
   configuration.preferencesDirectory = configuration.storage.directory / "preferences";
   configuration.notifyDirectory = configuration.storage.directory / "notify";
+  configuration.drivers.textfiles = configuration.storage.directory / "drivers";
 }
 
-// Tables that are valid in a file but that nothing reads yet: only their types are checked.
-void checkOtherTables(TableReader& root) {
-  std::filesystem::path path;
-  bool flag = false;
-
-  TableReader drivers = root.table("drivers");
-  drivers.read("alsa", flag);
-  drivers.read("alsa_root", path, kLongestPath);
-  drivers.read("pipewire", flag);
-  drivers.read("textfiles", path, kLongestPath);
-  drivers.finish();
+void readDrivers(TableReader table, Configuration::Drivers& drivers) {
+  table.read("alsa", drivers.alsa);
+  table.read("alsa_root", drivers.alsaRoot, kLongestPath);
+  table.read("pipewire", drivers.pipewire);
+  table.read("textfiles", drivers.textfiles, kLongestPath);
+  table.finish();
 }
 
 std::variant<Configuration, ConfigurationError> parse(const std::string& file,
@@ -235,7 +231,7 @@ std::variant<Configuration, ConfigurationError> parse(const std::string& file,
   readDiagnostics(root.table("diagnostics"), configuration.keepSnapshots);
   readFeatures(root.table("features"), configuration.features);
   configuration.device = root.table("device").readValues();
-  checkOtherTables(root);
+  readDrivers(root.table("drivers"), configuration.drivers);
   root.finish();
   if (mistakes.first().has_value()) return *mistakes.first();
   return configuration;

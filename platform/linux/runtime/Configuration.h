@@ -56,6 +56,12 @@ struct Configuration {
     std::optional<Tls> tls;             // none: as the servers' URLs say
     std::filesystem::path credentials;  // a NATS credentials file; empty: none
   };
+  struct Drivers {
+    bool alsa = true;
+    std::filesystem::path alsaRoot = "/";  // /proc/asound and /sys/class/sound are below it
+    bool pipewire = true;
+    std::filesystem::path textfiles;  // directory of *.prom files
+  };
   struct Limits {
     std::uint64_t clientHistoryMegabytes = 256;
     std::uint64_t clientSessions = 100'000;
@@ -66,6 +72,7 @@ struct Configuration {
   Analytics analytics;
   Link link;
   Limits limits;
+  Drivers drivers;
   std::filesystem::path preferencesDirectory;  // [preferences]: <directory>/<user>/<domain>.toml
   std::filesystem::path notifyDirectory;       // [notify]: files that post by their names
   LogLevel logLevel = LogLevel::kDefault;

@@ -1,0 +1,46 @@
+#include "platform/linux/drivers/ReadingMaker.h"
+
+#include <utility>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+bool isListOf(const ChannelList& list, const std::vector<ChannelList::Channel>& channels) {
+  if (list.size() != channels.size()) return false;
+  for (std::size_t index = 0; index < channels.size(); ++index) {
+    if (list[index] != channels[index]) return false;
+  }
+  return true;
+}
+
+}  // namespace
+
+void ReadingMaker::add(const std::string& name, ChannelDescription description,
+                       std::span<const std::uint64_t> values) {
+  const auto found = known_.find(name);
+  Channel channel = found != known_.end() && *found->second == description
+                        ? found->second
+                        : std::make_shared<const ChannelDescription>(std::move(description));
+  added_.insert_or_assign(name, channel);
+  add(std::move(channel), values);
+}
+
+void ReadingMaker::add(Channel channel, std::span<const std::uint64_t> values) {
+  channels_.push_back(std::move(channel));
+  values_.insert(values_.end(), values.begin(), values.end());
+}
+
+std::shared_ptr<const Reading> ReadingMaker::finish() {
+  if (list_ == nullptr || !isListOf(*list_, channels_)) {
+    list_ = std::make_shared<const ChannelList>(channels_);
+  }
+  known_ = std::exchange(added_, {});
+  channels_.clear();
+  auto reading = std::make_shared<Reading>();
+  reading->channels = list_;
+  reading->values = values_;
+  values_.clear();
+  return reading;
+}
+
+}  // namespace halvox::platform::linux_

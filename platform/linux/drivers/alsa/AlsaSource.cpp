@@ -1,0 +1,168 @@
+#include "platform/linux/drivers/alsa/AlsaSource.h"
+
+#include <algorithm>
+#include <array>
+#include <optional>
+#include <utility>
+
+#include <dirent.h>
+#include <fcntl.h>
+
+#include "platform/linux/drivers/SmallFile.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::size_t kLargestFile = 16'384;
+constexpr std::size_t kMostEntries = 256;  // cards, PCMs of a card, substreams of a PCM
+
+using Directory = UniqueHandle<DIR*, ::closedir>;
+
+// True for a name such as "card0": the letters, then a number.
+std::optional<unsigned> numberBehind(std::string_view name, std::string_view letters) {
+  if (!name.starts_with(letters)) return std::nullopt;
+  const auto number = parseSysfsNumber(name.substr(letters.size()));
+  if (!number.has_value() || *number > 9999) return std::nullopt;
+  return static_cast<unsigned>(*number);
+}
+
+std::vector<std::string> namesIn(int directory) {
+  std::vector<std::string> names;
+  UniqueFd own(::fcntl(directory, F_DUPFD_CLOEXEC, 0));
+  const Directory stream(::fdopendir(own.get()));
+  if (!stream) return names;
+  (void)own.release();  // the stream closes it
+  while (const dirent* found = ::readdir(stream.get())) {
+    if (found->d_name[0] != '.') names.emplace_back(found->d_name);
+    if (names.size() == kMostEntries) break;
+  }
+  std::ranges::sort(names);
+  return names;
+}
+
+std::optional<std::string> textOf(int directory, const std::string& name) {
+  SmallFile file = readSmallFile(directory, name.c_str(), kLargestFile);
+  if (file.outcome != SmallFile::Outcome::kRead) return std::nullopt;
+  return std::move(file.text);
+}
+
+std::optional<std::uint64_t> numberIn(int directory, const char* name) {
+  const auto text = textOf(directory, name);
+  return text.has_value() ? parseSysfsNumber(*text) : std::nullopt;
+}
+
+std::vector<std::string> pcmStates() { return {kPcmStates.begin(), kPcmStates.end()}; }
+
+}  // namespace
+
+std::shared_ptr<const Reading> AlsaSource::read() {
+  ++round_;
+  time_ = now_();
+  const UniqueFd asound = openDirectory((root_ / "proc/asound").c_str());
+  if (asound) {
+    const auto names = parseCards(textOf(asound.get(), "cards").value_or(""));
+    for (const std::string& folder : namesIn(asound.get())) {
+      const auto number = numberBehind(folder, "card");
+      if (!number.has_value()) continue;
+      const auto name = names.find(*number);
+      readCard(asound.get(), folder, {name == names.end() ? folder : name->second});
+    }
+  }
+  const auto isGone = [this](const auto& item) { return item.second.round != round_; };
+  std::erase_if(substreams_, isGone);
+  std::erase_if(powers_, isGone);
+  return readings_.finish();
+}
+
+void AlsaSource::readCard(int asound, const std::string& folder, Card card) {
+  const UniqueFd directory = openDirectoryAt(asound, folder.c_str());
+  if (!directory) return;
+  for (const std::string& pcm : namesIn(directory.get())) {
+    if (pcm.starts_with("pcm")) readPcm(directory.get(), folder + '/' + pcm, pcm, card);
+  }
+  readPower(folder, card);
+}
+
+void AlsaSource::readPcm(int cardDirectory, const std::string& path, const std::string& folder,
+                         Card& card) {
+  const bool isPlayback = folder.ends_with('p');
+  if (!isPlayback && !folder.ends_with('c')) return;
+  const UniqueFd directory = openDirectoryAt(cardDirectory, folder.c_str());
+  if (!directory) return;
+  std::string name = parsePcmName(textOf(directory.get(), "info").value_or("")).value_or(folder);
+  // Of several devices of one name the later ones are told apart by their number.
+  const int others = card.pcmNames[(isPlayback ? "p" : "c") + name]++;
+  if (others > 0) name += " " + std::to_string(others + 1);
+
+  ChannelDescription pcm;
+  pcm.driverName = card.name;
+  pcm.group = isPlayback ? "Tx" : "Rx";
+  pcm.subGroup = std::move(name);
+  for (const std::string& substream : namesIn(directory.get())) {
+    readSubstream(directory.get(), path + '/' + substream, substream, pcm);
+  }
+}
+
+void AlsaSource::readSubstream(int pcmDirectory, const std::string& path, const std::string& folder,
+                               const ChannelDescription& pcm) {
+  const auto number = numberBehind(folder, "sub");
+  if (!number.has_value() || substreams_.size() >= kMostChannels) return;
+  const auto text = textOf(pcmDirectory, folder + "/status");
+  const auto status = text.has_value() ? parsePcmStatus(*text) : std::nullopt;
+  if (!status.has_value()) return;
+  Substream& substream = substreams_[path];
+  substream.round = round_;
+  PcmCounters& counters = substream.counters;
+  counters.look(*status, time_);
+
+  const std::string suffix = *number == 0 ? "" : " " + std::to_string(*number);
+  const auto add = [&](const char* name, IOReportFormat format, const char* unit,
+                       std::span<const std::uint64_t> values) {
+    ChannelDescription channel = pcm;
+    channel.format = format;
+    channel.channelName = name + suffix;
+    channel.unitLabel = unit;
+    if (format == IOReportFormat::kState) channel.states = pcmStates();
+    readings_.add(path + '/' + name, std::move(channel), values);
+  };
+  add("frames", IOReportFormat::kSimple, "frames", std::array{counters.hardwareFrames()});
+  add("application frames", IOReportFormat::kSimple, "frames",
+      std::array{counters.applicationFrames()});
+  std::vector<std::uint64_t> states;
+  for (const auto& [transitions, residency] : counters.states()) {
+    states.push_back(transitions);
+    states.push_back(static_cast<std::uint64_t>(residency.count()));
+  }
+  add("state", IOReportFormat::kState, "us", states);
+}
+
+void AlsaSource::readPower(const std::string& folder, const Card& card) {
+  const UniqueFd directory =
+      openDirectory((root_ / "sys/class/sound" / folder / "device/power").c_str());
+  if (!directory) return;
+  const auto active = numberIn(directory.get(), "runtime_active_time");
+  const auto suspended = numberIn(directory.get(), "runtime_suspended_time");
+  if (!active.has_value() || !suspended.has_value()) return;
+  const bool isSuspended =
+      cleanText(textOf(directory.get(), "runtime_status").value_or("")) == "suspended";
+
+  const bool isNew = !powers_.contains(folder);
+  Power& power = powers_[folder];
+  power.round = round_;
+  if (!isNew && power.isSuspended != isSuspended) {
+    ++(isSuspended ? power.suspensions : power.activations);
+  }
+  power.isSuspended = isSuspended;
+  ChannelDescription channel;
+  channel.format = IOReportFormat::kState;
+  channel.driverName = card.name;
+  channel.group = "StateTransitionTimes_ms";
+  channel.subGroup = "Runtime";
+  channel.channelName = "power";
+  channel.unitLabel = "ms";
+  channel.states = {"active", "suspended"};
+  readings_.add(folder + "/power", std::move(channel),
+                std::array{power.activations, *active, power.suspensions, *suspended});
+}
+
+}  // namespace halvox::platform::linux_

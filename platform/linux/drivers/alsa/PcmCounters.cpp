@@ -1,0 +1,27 @@
+#include "platform/linux/drivers/alsa/PcmCounters.h"
+
+namespace halvox::platform::linux_ {
+
+void PcmCounters::look(const PcmStatus& status, Clock::time_point now) {
+  if (last_.has_value()) {
+    states_[last_->state].residency +=
+        std::chrono::duration_cast<std::chrono::microseconds>(now - lastTime_);
+    if (last_->state != status.state) ++states_[status.state].transitions;
+  }
+  const bool isNewStream =
+      !last_.has_value() || last_->owner != status.owner || status.hardwareFrames < hardware_.last;
+  count(hardware_, status.hardwareFrames, isNewStream);
+  count(application_, status.applicationFrames, isNewStream);
+  last_ = status;
+  lastTime_ = now;
+}
+
+void PcmCounters::count(Pointer& pointer, std::uint64_t now, bool isNewStream) {
+  const std::uint64_t before = isNewStream ? 0 : pointer.last;
+  // An application may take back what it has written; it then counts when it is written again.
+  if (now < before) return;
+  pointer.total += now - before;
+  pointer.last = now;
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,45 @@
+#pragma once
+
+#include <array>
+#include <chrono>
+#include <cstdint>
+#include <optional>
+
+#include "platform/linux/drivers/alsa/AlsaText.h"
+
+namespace halvox::platform::linux_ {
+
+// Counts one PCM substream over its streams. The kernel's pointers begin anew with each stream; the
+// counts here go on. What happens between two looks and leaves no trace is not seen: a state holds
+// from the look that found it to the look that finds another.
+// Belongs to the source's thread.
+class PcmCounters {
+ public:
+  using Clock = std::chrono::steady_clock;
+
+  struct State {
+    std::uint64_t transitions = 0;
+    std::chrono::microseconds residency{};
+  };
+
+  void look(const PcmStatus& status, Clock::time_point now);
+
+  [[nodiscard]] std::uint64_t hardwareFrames() const { return hardware_.total; }
+  [[nodiscard]] std::uint64_t applicationFrames() const { return application_.total; }
+  [[nodiscard]] const std::array<State, kPcmStates.size()>& states() const { return states_; }
+
+ private:
+  struct Pointer {
+    std::uint64_t last = 0;
+    std::uint64_t total = 0;
+  };
+  static void count(Pointer& pointer, std::uint64_t now, bool isNewStream);
+
+  std::optional<PcmStatus> last_;
+  Clock::time_point lastTime_{};
+  Pointer hardware_;
+  Pointer application_;
+  std::array<State, kPcmStates.size()> states_{};
+};
+
+}  // namespace halvox::platform::linux_

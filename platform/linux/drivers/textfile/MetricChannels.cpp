@@ -1,0 +1,312 @@
+#include "platform/linux/drivers/textfile/MetricChannels.h"
+
+#include <algorithm>
+#include <limits>
+#include <map>
+#include <optional>
+#include <tuple>
+#include <unordered_map>
+#include <utility>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::size_t kMostStates = 64;
+constexpr std::size_t kMostBuckets = 256;
+
+// Thrown and caught in this file only: metrics that contradict themselves.
+struct Contradiction {
+  MetricError error;
+};
+
+[[noreturn]] void refuse(std::size_t line, std::string what) {
+  throw Contradiction{{line, std::move(what)}};
+}
+
+using SamplesByLabels = std::map<MetricLabels, std::vector<const MetricSample*>>;
+
+// The samples of a family, by their labels without that one.
+SamplesByLabels byLabelsWithout(std::string_view left, const std::vector<MetricSample>& samples) {
+  SamplesByLabels result;
+  for (const MetricSample& sample : samples) {
+    MetricLabels labels = sample.labels;
+    std::erase_if(labels, [left](const MetricLabel& label) { return label.name == left; });
+    result[std::move(labels)].push_back(&sample);
+  }
+  return result;
+}
+
+const std::string& labelOf(const MetricSample& sample, std::string_view name) {
+  const auto found = std::ranges::find(sample.labels, name, &MetricLabel::name);
+  if (found == sample.labels.end()) {
+    refuse(sample.line, "expected the label " + std::string(name));
+  }
+  return found->value;
+}
+
+std::uint64_t countOf(const MetricSample& sample) {
+  const auto count = sample.number.cutDown();
+  if (!count.has_value() || *count < 0) {
+    refuse(sample.line, "expected a count, from 0 to 9223372036854775807");
+  }
+  return static_cast<std::uint64_t>(*count);
+}
+
+ChannelDescription describe(const MetricFamily& family, const MetricLabels& labels,
+                            IOReportFormat format) {
+  ChannelDescription channel;
+  channel.format = format;
+  channel.channelName = family.name;
+  channel.unitLabel = family.unit;
+  std::string others;
+  for (const auto& [name, value] : labels) {
+    if (name == "driver") {
+      channel.driverName = value;
+    } else if (name == "group") {
+      channel.group = value;
+    } else if (name == "subgroup") {
+      channel.subGroup = value;
+    } else if (name == "channel") {
+      channel.channelName = value;
+    } else if (name == "unit") {
+      channel.unitLabel = value;
+    } else {
+      others += " " + name + "=" + value;
+    }
+  }
+  *channel.channelName += others;
+  return channel;
+}
+
+bool isCreationTime(const MetricSample& sample) { return sample.suffix == "_created"; }
+
+// Makes the channels of one text.
+class ChannelMaker {
+ public:
+  explicit ChannelMaker(const OpenMetricsText::Families& families) : families_(families) {
+    for (const MetricFamily& family : families) byName_.emplace(family.name, &family);
+    for (const MetricFamily& family : families) claimStateCounters(family);
+  }
+
+  std::vector<MetricChannel> make() {
+    for (const MetricFamily& family : families_) add(family);
+    refuseDoubles();
+    return std::move(channels_);
+  }
+
+ private:
+  // The counter of that name, as either form of the text writes it.
+  const MetricFamily* counterNamed(const std::string& name) const {
+    for (const std::string& form : {name, name + "_total"}) {
+      const auto found = byName_.find(form);
+      if (found != byName_.end() && found->second->type == MetricType::kCounter) {
+        return found->second;
+      }
+    }
+    return nullptr;
+  }
+
+  // The counters of a state set are no channels of their own.
+  void claimStateCounters(const MetricFamily& family) {
+    if (family.type != MetricType::kStateset) return;
+    claimed_[counterNamed(family.name + "_residency")] = true;
+    claimed_[counterNamed(family.name + "_transitions")] = true;
+  }
+
+  void add(const MetricFamily& family) {
+    switch (family.type) {
+      case MetricType::kCounter:
+        if (!claimed_.contains(&family)) addCounter(family);
+        return;
+      case MetricType::kGauge:
+        return addGauge(family);
+      case MetricType::kHistogram:
+        return addHistograms(family);
+      case MetricType::kStateset:
+        return addStates(family);
+      case MetricType::kUnknown:
+      case MetricType::kOther:
+        return;
+    }
+  }
+
+  void addCounter(const MetricFamily& family) {
+    for (const MetricSample& sample : family.samples) {
+      if (isCreationTime(sample)) continue;
+      channels_.push_back({describe(family, sample.labels, IOReportFormat::kSimple),
+                           {countOf(sample)},
+                           sample.line});
+    }
+  }
+
+  // A gauge may have no value at the moment (NaN); then there is no such channel.
+  void addGauge(const MetricFamily& family) {
+    for (const MetricSample& sample : family.samples) {
+      const auto value = sample.number.cutDown();
+      if (!value.has_value()) continue;
+      channels_.push_back({describe(family, sample.labels, IOReportFormat::kSimple),
+                           {static_cast<std::uint64_t>(*value)},
+                           sample.line});
+    }
+  }
+
+  void addHistograms(const MetricFamily& family) {
+    for (const auto& [labels, samples] : byLabelsWithout("le", family.samples)) {
+      addHistogram(describe(family, labels, IOReportFormat::kHistogram), samples);
+    }
+  }
+
+  void addHistogram(ChannelDescription description,
+                    const std::vector<const MetricSample*>& samples);
+  void addStates(const MetricFamily& family);
+  void addStateChannel(const MetricFamily& family, const MetricLabels& labels,
+                       const std::vector<const MetricSample*>& samples);
+  void refuseDoubles() const;
+
+  const OpenMetricsText::Families& families_;
+  std::unordered_map<std::string, const MetricFamily*> byName_;
+  std::unordered_map<const MetricFamily*, bool> claimed_;
+  std::vector<MetricChannel> channels_;
+};
+
+// The buckets of one histogram, taken apart as they come.
+class BucketReader {
+ public:
+  void take(const MetricSample& sample) {
+    if (isComplete_) refuse(sample.line, "expected no bucket behind that of +Inf");
+    if (buckets_.size() == kMostBuckets) refuse(sample.line, "too many buckets");
+    const std::int64_t upper = bound(sample);
+    const std::uint64_t hits = countOf(sample);
+    if (!buckets_.empty() && upper <= lower_) {
+      refuse(sample.line, "expected a higher bound than that of the bucket before");
+    }
+    if (hits < total_) refuse(sample.line, "expected no fewer hits than in the bucket before");
+    buckets_.push_back({lower_, upper});
+    values_.push_back(hits - total_);
+    lower_ = upper;
+    total_ = hits;
+  }
+
+  // The bounds go into the description, the hits with minimum and maximum into the values.
+  std::vector<std::uint64_t> finish(std::size_t line, const MetricSample* count,
+                                    ChannelDescription& description) {
+    if (!isComplete_) refuse(line, "expected a bucket with le=\"+Inf\"");
+    if (count != nullptr && countOf(*count) != total_) {
+      refuse(count->line, "expected the count of the bucket with le=\"+Inf\"");
+    }
+    const auto isHit = [](std::uint64_t hits) { return hits > 0; };
+    const auto lowest = std::ranges::find_if(values_, isHit);
+    std::int64_t minimum = 0;
+    std::int64_t maximum = 0;
+    for (auto hit = lowest; hit != values_.end();
+         hit = std::find_if(hit + 1, values_.end(), isHit)) {
+      maximum = buckets_[static_cast<std::size_t>(hit - values_.begin())].upper;
+    }
+    if (lowest != values_.end()) {
+      minimum = buckets_[static_cast<std::size_t>(lowest - values_.begin())].lower;
+    }
+    values_.push_back(static_cast<std::uint64_t>(minimum));
+    values_.push_back(static_cast<std::uint64_t>(maximum));
+    description.buckets = std::move(buckets_);
+    return std::move(values_);
+  }
+
+ private:
+  std::int64_t bound(const MetricSample& sample) {
+    const std::string& text = labelOf(sample, "le");
+    isComplete_ = text == "+Inf";
+    if (isComplete_) return std::numeric_limits<std::int64_t>::max();
+    const auto number = MetricNumber::parse(text);
+    const auto whole = number.has_value() ? number->cutDown() : std::nullopt;
+    if (!whole.has_value() || *whole < 0 || static_cast<double>(*whole) != number->value) {
+      refuse(sample.line, "expected a whole number of the unit, or +Inf, as the bucket's bound");
+    }
+    return *whole;
+  }
+
+  std::vector<BucketBounds> buckets_;
+  std::vector<std::uint64_t> values_;
+  std::int64_t lower_ = 0;
+  std::uint64_t total_ = 0;
+  bool isComplete_ = false;
+};
+
+void ChannelMaker::addHistogram(ChannelDescription description,
+                                const std::vector<const MetricSample*>& samples) {
+  BucketReader buckets;
+  const MetricSample* count = nullptr;
+  for (const MetricSample* sample : samples) {
+    if (sample->suffix == "_bucket") buckets.take(*sample);
+    if (sample->suffix == "_count") count = sample;
+  }
+  const std::size_t line = samples.front()->line;
+  auto values = buckets.finish(line, count, description);
+  channels_.push_back({std::move(description), std::move(values), line});
+}
+
+void ChannelMaker::addStates(const MetricFamily& family) {
+  for (const auto& [labels, samples] : byLabelsWithout(family.name, family.samples)) {
+    addStateChannel(family, labels, samples);
+  }
+}
+
+// The counter's value for the state, whose sample has the same labels.
+std::uint64_t stateCount(const MetricFamily& counter, const MetricSample& state) {
+  for (const MetricSample& sample : counter.samples) {
+    if (!isCreationTime(sample) && sample.labels == state.labels) return countOf(sample);
+  }
+  refuse(state.line, "expected " + counter.name + " of this state too");
+}
+
+void ChannelMaker::addStateChannel(const MetricFamily& family, const MetricLabels& labels,
+                                   const std::vector<const MetricSample*>& samples) {
+  const MetricFamily* residency = counterNamed(family.name + "_residency");
+  const MetricFamily* transitions = counterNamed(family.name + "_transitions");
+  // Which state holds now says nothing of a time, so alone it is no channel.
+  if (residency == nullptr && transitions == nullptr) return;
+  const std::size_t line = samples.front()->line;
+  if (residency == nullptr) refuse(line, "expected a counter " + family.name + "_residency");
+  if (transitions == nullptr) refuse(line, "expected a counter " + family.name + "_transitions");
+  if (samples.size() > kMostStates) refuse(line, "too many states");
+
+  MetricChannel channel{describe(family, labels, IOReportFormat::kState), {}, line};
+  if (channel.description.unitLabel.empty()) channel.description.unitLabel = residency->unit;
+  for (const MetricSample* sample : samples) {
+    if (sample->number.value != 0 && sample->number.value != 1) {
+      refuse(sample->line, "expected 0 or 1 as the value of a state");
+    }
+    channel.description.states.push_back(labelOf(*sample, family.name));
+    channel.values.push_back(stateCount(*transitions, *sample));
+    channel.values.push_back(stateCount(*residency, *sample));
+  }
+  channels_.push_back(std::move(channel));
+}
+
+void ChannelMaker::refuseDoubles() const {
+  using Name = std::tuple<IOReportFormat, std::optional<std::string>, std::optional<std::string>,
+                          std::optional<std::string>, std::optional<std::string>>;
+  std::map<Name, std::size_t> lines;
+  for (const auto& [description, values, line] : channels_) {
+    const auto [found, isNew] =
+        lines.try_emplace(Name(description.format, description.driverName, description.group,
+                               description.subGroup, description.channelName),
+                          line);
+    if (!isNew) {
+      refuse(line, "this channel was told before, in line " + std::to_string(found->second));
+    }
+  }
+}
+
+}  // namespace
+
+std::variant<std::vector<MetricChannel>, MetricError> MetricChannels::from(std::string_view text) {
+  auto families = OpenMetricsText::parse(text);
+  if (auto* error = std::get_if<MetricError>(&families)) return std::move(*error);
+  try {
+    return ChannelMaker(std::get<OpenMetricsText::Families>(families)).make();
+  } catch (const Contradiction& contradiction) {
+    return contradiction.error;
+  }
+}
+
+}  // namespace halvox::platform::linux_

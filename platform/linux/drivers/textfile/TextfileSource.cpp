@@ -1,0 +1,173 @@
+#include "platform/linux/drivers/textfile/TextfileSource.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <chrono>
+#include <system_error>
+#include <unordered_set>
+#include <utility>
+
+#include <dirent.h>
+#include <fcntl.h>
+
+#include "platform/linux/drivers/DriverSourceLog.h"
+#include "platform/linux/drivers/SmallFile.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog(driversCategory, "TextfileSource");
+// A file's time goes on in steps of up to 10 ms: a file that was read within one may change again
+// without another time.
+constexpr std::int64_t kTimeStep = 20'000'000;
+
+constexpr const char* kLeftOut = "; the file is left out";
+
+using Directory = UniqueHandle<DIR*, ::closedir>;
+
+std::int64_t nanoseconds(const timespec& time) {
+  return std::int64_t{time.tv_sec} * 1'000'000'000 + time.tv_nsec;
+}
+
+std::int64_t now() {
+  return std::chrono::duration_cast<std::chrono::nanoseconds>(
+             std::chrono::system_clock::now().time_since_epoch())
+      .count();
+}
+
+std::string reasonOf(const SmallFile& file) {
+  switch (file.outcome) {
+    case SmallFile::Outcome::kTooLarge:
+      return "the file is larger than " + std::to_string(OpenMetricsText::kLargestText) + " bytes";
+    case SmallFile::Outcome::kNotRegular:
+      return "expected a regular file";
+    case SmallFile::Outcome::kRead:
+    case SmallFile::Outcome::kMissing:
+    case SmallFile::Outcome::kFailed:
+      break;
+  }
+  return std::system_category().message(file.error);
+}
+
+std::string fullName(const ChannelDescription& channel) {
+  std::string name = std::to_string(static_cast<int>(channel.format));
+  for (const auto* part :
+       {&channel.driverName, &channel.group, &channel.subGroup, &channel.channelName}) {
+    name += part->has_value() ? '\n' + std::to_string((*part)->size()) + ':' + **part : "\n-";
+  }
+  return name;
+}
+
+}  // namespace
+
+std::shared_ptr<const Reading> TextfileSource::read() {
+  ++round_;
+  const UniqueFd directory = openDirectory(directory_.c_str());
+  for (const std::string& file : directory ? list(directory.get()) : std::vector<std::string>()) {
+    Entry& entry = entries_[file];
+    entry.round = round_;
+    readEntry(directory.get(), file, entry);
+  }
+  isChanged_ |=
+      std::erase_if(entries_, [this](const auto& item) { return item.second.round != round_; }) > 0;
+  if (std::exchange(isChanged_, false)) chooseChannels();
+  for (const auto& [file, entry] : entries_) {
+    if (!entry.isGood) continue;
+    for (std::size_t index = 0; index < entry.channels.size(); ++index) {
+      if (entry.isShown[index]) readings_.add(entry.channels[index], entry.values[index]);
+    }
+  }
+  return readings_.finish();
+}
+
+std::vector<std::string> TextfileSource::list(int directory) {
+  std::vector<std::string> files;
+  UniqueFd own(::fcntl(directory, F_DUPFD_CLOEXEC, 0));
+  const Directory stream(::fdopendir(own.get()));
+  if (!stream) return files;
+  (void)own.release();  // the stream closes it
+  while (const dirent* found = ::readdir(stream.get())) {
+    const std::string_view name = found->d_name;
+    if (name.ends_with(".prom") && !name.starts_with('.')) files.emplace_back(name);
+  }
+  std::ranges::sort(files);
+  const bool areTooMany = files.size() > kMostFiles;
+  if (areTooMany && !std::exchange(hasToldOfTooMany_, true)) {
+    kLog.error("the directory ", directory_.string(), " has more than ", kMostFiles,
+               " files; those behind are left out");
+  }
+  hasToldOfTooMany_ = areTooMany;
+  if (areTooMany) files.resize(kMostFiles);
+  return files;
+}
+
+void TextfileSource::readEntry(int directory, const std::string& file, Entry& entry) {
+  struct stat status {};
+  State state;
+  if (::fstatat(directory, file.c_str(), &status, 0) != 0) {
+    state.error = errno;
+  } else {
+    state = {0, status.st_dev, status.st_ino, status.st_size, nanoseconds(status.st_mtim)};
+  }
+  const bool isSame = state == entry.state;
+  if (isSame && entry.isSettled) return;
+  if (!isSame) entry.complaint.clear();
+  entry.state = state;
+  entry.isSettled = state.error != 0 || now() - state.changedAt > kTimeStep;
+  entry.isGood = false;
+  isChanged_ = true;
+
+  const SmallFile content = readSmallFile(directory, file.c_str(), OpenMetricsText::kLargestText);
+  if (content.outcome == SmallFile::Outcome::kMissing) return;  // gone since it was listed
+  if (content.outcome != SmallFile::Outcome::kRead) {
+    return complain(file, ": " + reasonOf(content) + kLeftOut, entry);
+  }
+  auto parsed = MetricChannels::from(content.text);
+  if (const auto* error = std::get_if<MetricError>(&parsed)) {
+    return complain(file, ":" + std::to_string(error->line) + ": " + error->what + kLeftOut, entry);
+  }
+  take(std::move(std::get<std::vector<MetricChannel>>(parsed)), entry);
+}
+
+void TextfileSource::take(std::vector<MetricChannel> channels, Entry& entry) {
+  std::map<std::string, Channel> known;
+  for (const Channel& channel : entry.channels) known.emplace(fullName(*channel), channel);
+  entry.channels.clear();
+  entry.values.clear();
+  for (auto& [description, values, line] : channels) {
+    const auto found = known.find(fullName(description));
+    entry.channels.push_back(
+        found != known.end() && *found->second == description
+            ? found->second
+            : std::make_shared<const ChannelDescription>(std::move(description)));
+    entry.values.push_back(std::move(values));
+  }
+  entry.isGood = true;
+}
+
+void TextfileSource::complain(const std::string& file, const std::string& what, Entry& entry) {
+  if (entry.complaint == what) return;
+  entry.complaint = what;
+  kLog.error("driver counters of ", (directory_ / file).string(), what);
+}
+
+void TextfileSource::chooseChannels() {
+  std::unordered_set<std::string> told;
+  for (auto& [file, entry] : entries_) {
+    if (!entry.isGood) continue;
+    entry.isShown.assign(entry.channels.size(), true);
+    for (std::size_t index = 0; index < entry.channels.size(); ++index) {
+      if (told.insert(fullName(*entry.channels[index])).second) continue;
+      entry.isShown[index] = false;
+      // One line a file, however many channels it shares with others.
+      if (entry.complaint.empty()) {
+        complain(file,
+                 ": a file before it tells the channel " + *entry.channels[index]->channelName +
+                     " too; only that one counts",
+                 entry);
+      }
+    }
+  }
+}
+
+}  // namespace halvox::platform::linux_
