@@ -116,6 +116,12 @@ struct ExtractSnapshot {
   bool force = false;       // replaces files that are there
 };
 
+// The summaries that the service leaves of its sessions on internal builds.
+struct ShowSummaries {
+  std::vector<std::string> files{};  // none: the newest of the service's
+  std::uint64_t last = 10;
+};
+
 // What all commands take.
 struct CommonOptions {
   bool json = false;
@@ -124,7 +130,9 @@ struct CommonOptions {
 };
 
 struct Command {
-  std::variant<Request, RunScript, RunShell, ShowEvents, Preferences, PostNotification> what;
+  std::variant<Request, RunScript, RunShell, ShowEvents, ShowSummaries, Preferences,
+               PostNotification, ShowSnapshot, ExtractSnapshot>
+      what;
   CommonOptions options;
 };
 

@@ -55,7 +55,9 @@ class CommandLineParser {
       addConnectionOptions(app_);
       addScripts();
       addEvents();
+      addSummary();
       addSettings();
+      addSnapshots();
     } else {
       addScriptRequests();
     }
@@ -151,7 +153,9 @@ class CommandLineParser {
   void addScriptRequests();
   void addScripts();
   void addEvents();
+  void addSummary();
   void addSettings();
+  void addSnapshots();
   [[nodiscard]] Preferences makePreferences() const;
   [[nodiscard]] Send makeSend() const;
   static std::string helpOf(const CLI::App& app);
@@ -174,8 +178,10 @@ class CommandLineParser {
   std::optional<std::chrono::milliseconds> time_;
   RunScript script_;
   ShowEvents events_;
+  ShowSummaries summaries_;
   Preferences preferences_;
   PostNotification notification_;
+  ExtractSnapshot snapshot_;
 };
 
 void CommandLineParser::addSessionRequests() {
@@ -340,6 +346,19 @@ void CommandLineParser::addEvents() {
                   "configuration puts it)")
       ->type_name("FILE");
   onRun(events, [this] { return events_; });
+}
+
+void CommandLineParser::addSummary() {
+  auto& summary =
+      addCommand("summary", "Show what sessions of internal builds came to",
+                 "halvoxctl summary --last 5", "A single FILE is shown with its messages.");
+  auto* last = summary.add_option("--last", summaries_.last,
+                                  "Without a FILE: so many, the newest (default: 10)");
+  last->type_name("N")->check(CLI::NonNegativeNumber);
+  summary
+      .add_option("FILE", summaries_.files, "Summary files (default: the newest of the service's)")
+      ->excludes(last);
+  onRun(summary, [this] { return summaries_; });
 }
 
 void CommandLineParser::addSettings() {

@@ -13,6 +13,7 @@
 #include "tools/RequestRunner.h"
 #include "tools/Script.h"
 #include "tools/SnapshotFiles.h"
+#include "tools/Summary.h"
 
 namespace halvox::tools {
 namespace {
@@ -60,6 +61,9 @@ ExitStatus runCommand(const Command& command, const ToolStreams& streams) {
   }
   if (const auto* extract = std::get_if<ExtractSnapshot>(&command.what)) {
     return extractSnapshot(*extract, form, streams.output, streams.errors);
+  }
+  if (const auto* summaries = std::get_if<ShowSummaries>(&command.what)) {
+    return showSummaries(*summaries, form, streams.output, streams.errors);
   }
   return showEvents(std::get<ShowEvents>(command.what), form, streams.output,
                     streams.outputDescriptor, streams.errors);

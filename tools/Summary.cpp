@@ -1,0 +1,178 @@
+#include "tools/Summary.h"
+
+#include <algorithm>
+#include <array>
+#include <cstdio>
+#include <filesystem>
+#include <iomanip>
+#include <utility>
+#include <variant>
+
+#include "platform/linux/runtime/Configuration.h"
+#include "tools/JsonText.h"
+#include "tools/SummaryReader.h"
+
+namespace halvox::tools {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr const char* kDirectory =
+    "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
+constexpr const char* kPrefix = "halvoxctl summary: ";
+
+using Row = std::array<std::string, 6>;
+
+struct Session {
+  std::string file;
+  SummaryName name;  // empty texts when the file has another name
+  SummaryTotals totals;
+};
+
+std::string secondsText(double seconds) {
+  std::array<char, 64> text{};
+  std::snprintf(text.data(), text.size(), "%.3f", seconds);
+  return text.data();
+}
+
+Row rowOf(const Session& session) {
+  const auto orDash = [](const std::string& text) {
+    return text.empty() ? std::string("-") : harmlessText(text);
+  };
+  const SummaryTotals& totals = session.totals;
+  return {orDash(session.name.time),
+          orDash(session.name.application),
+          orDash(session.name.service),
+          std::to_string(totals.messages),
+          totals.seconds ? secondsText(*totals.seconds) : "-",
+          totals.volumeIntervals > 0 ? std::to_string(totals.volumeIntervals) : "-"};
+}
+
+void printTable(const std::vector<Session>& sessions, std::ostream& out) {
+  std::vector<Row> rows = {{"TIME", "APPLICATION", "SERVICE", "MESSAGES", "SECONDS", "VOLUMES"}};
+  for (const Session& session : sessions) rows.push_back(rowOf(session));
+  std::array<std::size_t, std::tuple_size_v<Row>> widths{};
+  for (const Row& row : rows) {
+    for (std::size_t column = 0; column < row.size(); ++column) {
+      widths[column] = std::max(widths[column], row[column].size());
+    }
+  }
+  for (const Row& row : rows) {
+    for (std::size_t column = 0; column + 1 < row.size(); ++column) {
+      out << std::left << std::setw(static_cast<int>(widths[column])) << row[column] << "  ";
+    }
+    out << row.back() << '\n';
+  }
+}
+
+std::string jsonOf(const Session& session) {
+  const auto text = [](std::string_view value) { return harmlessJson(quoted(value)); };
+  std::string json = "{\"file\":" + text(session.file) + ",\"time\":" + text(session.name.time) +
+                     ",\"application\":" + text(session.name.application) +
+                     ",\"service\":" + text(session.name.service) +
+                     ",\"messages\":" + std::to_string(session.totals.messages);
+  if (session.totals.seconds) json += ",\"seconds\":" + secondsText(*session.totals.seconds);
+  return json + ",\"volume_intervals\":" + std::to_string(session.totals.volumeIntervals) + "}";
+}
+
+void printMessage(std::string_view identifier, std::string_view message, EventForm form,
+                  std::ostream& out) {
+  if (form == EventForm::kText) {
+    out << harmlessText(identifier) << "  " << fieldsOfJson(message) << '\n';
+  } else {
+    out << "{\"identifier\":" << harmlessJson(quoted(identifier))
+        << ",\"message\":" << harmlessJson(message) << "}\n";
+  }
+}
+
+bool read(const std::string& file, const SummaryMessageHandler& handler, Session& session,
+          std::ostream& errors) {
+  session.file = file;
+  session.name = parseSummaryName(fs::path(file).filename().string()).value_or(SummaryName{});
+  std::string error;
+  if (readSummary(file, handler, session.totals, error)) return true;
+  errors << kPrefix << harmlessText(file) << ": " << harmlessText(error) << '\n';
+  return false;
+}
+
+// The table stands before the messages and needs all of them, so the file is read twice.
+ExitStatus showOne(const std::string& file, EventForm form, std::ostream& out,
+                   std::ostream& errors) {
+  Session session;
+  if (!read(file, nullptr, session, errors)) return ExitStatus::kBadArguments;
+  if (form == EventForm::kText) {
+    printTable({session}, out);
+    out << '\n';
+  } else {
+    out << jsonOf(session) << '\n';
+  }
+  Session again;
+  const auto print = [&](std::string_view identifier, std::string_view message) {
+    printMessage(identifier, message, form, out);
+  };
+  return read(file, print, again, errors) ? ExitStatus::kDone : ExitStatus::kBadArguments;
+}
+
+// What is shown when some files are broken is still worth showing.
+ExitStatus showTable(const std::vector<std::string>& files, EventForm form, std::ostream& out,
+                     std::ostream& errors) {
+  std::vector<Session> sessions;
+  for (const std::string& file : files) {
+    Session session;
+    if (read(file, nullptr, session, errors)) sessions.push_back(std::move(session));
+  }
+  if (form == EventForm::kJson) {
+    for (const Session& session : sessions) out << jsonOf(session) << '\n';
+  } else if (!sessions.empty()) {
+    printTable(sessions, out);
+  }
+  return sessions.size() == files.size() ? ExitStatus::kDone : ExitStatus::kBadArguments;
+}
+
+// The newest summaries of the directory by the time in their names, newest last.
+std::vector<std::string> newestIn(const fs::path& directory, std::uint64_t count,
+                                  std::error_code& error) {
+  std::vector<std::pair<std::int64_t, std::string>> found;
+  for (fs::directory_iterator entry(directory, error), end; !error && entry != end;
+       entry.increment(error)) {
+    const auto name = parseSummaryName(entry->path().filename().string());
+    if (name) found.emplace_back(name->secondsSince1970, entry->path().string());
+  }
+  std::ranges::sort(found);
+  if (found.size() > count) found.erase(found.begin(), found.end() - static_cast<long>(count));
+  std::vector<std::string> files;
+  files.reserve(found.size());
+  for (auto& [time, file] : found) files.push_back(std::move(file));
+  return files;
+}
+
+ExitStatus showNewest(std::uint64_t count, EventForm form, std::ostream& out,
+                      std::ostream& errors) {
+  auto loaded = platform::linux_::loadConfiguration();
+  if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
+    errors << kPrefix << harmlessText(error->description) << '\n';
+    return ExitStatus::kBadConfiguration;
+  }
+  const fs::path directory =
+      std::get<platform::linux_::Configuration>(loaded).storage.root / kDirectory;
+  std::error_code error;
+  const auto files = newestIn(directory, count, error);
+  if (error || (files.empty() && count > 0)) {
+    errors << kPrefix << harmlessText(directory.string()) << ": "
+           << (error ? error.message() : "has no summaries")
+           << "; the service leaves them on internal builds only\n";
+    return ExitStatus::kNoService;
+  }
+  return showTable(files, form, out, errors);
+}
+
+}  // namespace
+
+ExitStatus showSummaries(const ShowSummaries& request, EventForm form, std::ostream& out,
+                         std::ostream& errors) {
+  if (request.files.empty()) return showNewest(request.last, form, out, errors);
+  if (request.files.size() == 1) return showOne(request.files.front(), form, out, errors);
+  return showTable(request.files, form, out, errors);
+}
+
+}  // namespace halvox::tools

@@ -1,0 +1,246 @@
+#include "tools/SummaryReader.h"
+
+#include <array>
+#include <cerrno>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <vector>
+
+#include <rapidjson/error/en.h>
+#include <rapidjson/filereadstream.h>
+#include <rapidjson/reader.h>
+#include <rapidjson/stringbuffer.h>
+#include <rapidjson/writer.h>
+#include <sys/stat.h>
+
+namespace halvox::tools {
+namespace {
+
+constexpr std::string_view kTimePattern = "dddddddd-ddddddsdddd";
+constexpr std::string_view kMark = "-halvox-";
+constexpr std::string_view kEnding = ".json";
+constexpr std::string_view kTimestampKey = "hvreporting_timestamp";
+constexpr std::string_view kVolumeInterval = "Volume_Summary_";
+constexpr std::size_t kBufferBytes = 64 * 1024;
+// Far more than any message of the service has.
+constexpr std::size_t kLongestMessage = 64 * 1024 * 1024;
+constexpr std::size_t kDeepestNesting = 256;
+
+bool fits(char character, char pattern) {
+  if (pattern == 'd') return character >= '0' && character <= '9';
+  if (pattern == 's') return character == '+' || character == '-';
+  return character == pattern;
+}
+
+bool isTime(std::string_view text) {
+  if (text.size() != kTimePattern.size()) return false;
+  for (std::size_t index = 0; index < text.size(); ++index) {
+    if (!fits(text[index], kTimePattern[index])) return false;
+  }
+  return true;
+}
+
+int number(std::string_view digits) { return std::atoi(std::string(digits).c_str()); }
+
+bool parseTimeOfName(std::string_view text, SummaryName& name) {
+  using namespace std::chrono;
+  if (!isTime(text)) return false;
+  const year_month_day date{year(number(text.substr(0, 4))),
+                            month(static_cast<unsigned>(number(text.substr(4, 2)))),
+                            day(static_cast<unsigned>(number(text.substr(6, 2))))};
+  const int hour = number(text.substr(9, 2));
+  const int minute = number(text.substr(11, 2));
+  const int second = number(text.substr(13, 2));
+  if (!date.ok() || hour > 23 || minute > 59 || second > 60) return false;
+  const auto offset = hours(number(text.substr(16, 2))) + minutes(number(text.substr(18, 2)));
+  const auto local =
+      sys_days(date).time_since_epoch() + hours(hour) + minutes(minute) + seconds(second);
+  const seconds utc = text[15] == '-' ? local + offset : local - offset;
+  name.secondsSince1970 = utc.count();
+  const auto part = [&](std::size_t at, std::size_t length) {
+    return std::string(text.substr(at, length));
+  };
+  name.time = part(0, 4) + "-" + part(4, 2) + "-" + part(6, 2) + " " + part(9, 2) + ":" +
+              part(11, 2) + ":" + part(13, 2) + " " + part(15, 5);
+  return true;
+}
+
+// Follows a summary's text: an array of objects that have one entry each, whose value is an object.
+// The text of a message is written anew, on one line, as it is read.
+class SummaryHandler {
+ public:
+  SummaryHandler(const SummaryMessageHandler& onMessage, SummaryTotals& totals)
+      : onMessage_(onMessage), totals_(totals) {}
+
+  [[nodiscard]] const std::string& problem() const { return problem_; }
+
+  bool Null() {
+    return value([&] { return writer_.Null(); });
+  }
+  bool Bool(bool flag) {
+    return value([&] { return writer_.Bool(flag); });
+  }
+  bool RawNumber(const char* text, rapidjson::SizeType length, bool /*copy*/) {
+    if (depth_ == kInMessage && isTimestamp_) noteTime(std::string(text, length));
+    return value([&] { return writer_.RawValue(text, length, rapidjson::kNumberType); });
+  }
+  bool String(const char* text, rapidjson::SizeType length, bool /*copy*/) {
+    return value([&] { return writer_.String(text, length); });
+  }
+  bool StartObject() {
+    if (depth_ == 0) return fail("expected an array of messages");
+    if (++depth_ == kInEntry) return beginEntry();
+    if (depth_ == kInMessage) buffer_.Clear(), writer_.Reset(buffer_);
+    if (depth_ > kDeepestNesting) return fail("a message is nested too deep");
+    return writer_.StartObject();
+  }
+  bool Key(const char* text, rapidjson::SizeType length, bool /*copy*/) {
+    if (depth_ == kInEntry) return beginMessage({text, length});
+    if (depth_ == kInMessage) isTimestamp_ = std::string_view(text, length) == kTimestampKey;
+    return withinLimit() && writer_.Key(text, length);
+  }
+  bool EndObject(rapidjson::SizeType /*members*/) {
+    const std::size_t left = depth_--;
+    if (left == kInEntry) return hasMessage_ || fail("an entry has no message");
+    if (!writer_.EndObject()) return false;
+    if (left == kInMessage) endMessage();
+    return true;
+  }
+  bool StartArray() {
+    ++depth_;
+    if (depth_ == 1) return true;
+    if (depth_ <= kInMessage) return fail("a message is no object");
+    if (depth_ > kDeepestNesting) return fail("a message is nested too deep");
+    return writer_.StartArray();
+  }
+  bool EndArray(rapidjson::SizeType /*elements*/) { return --depth_ == 0 || writer_.EndArray(); }
+  // Numbers come as text.
+  bool Int(int) { return false; }
+  bool Uint(unsigned) { return false; }
+  bool Int64(std::int64_t) { return false; }
+  bool Uint64(std::uint64_t) { return false; }
+  bool Double(double) { return false; }
+
+ private:
+  // How many arrays and objects are open in an entry, and in its message.
+  static constexpr std::size_t kInEntry = 2;
+  static constexpr std::size_t kInMessage = 3;
+
+  template <typename Write>
+  bool value(Write write) {
+    if (depth_ == 0) return fail("expected an array of messages");
+    if (depth_ < kInMessage) return fail("a message is no object");
+    return withinLimit() && write();
+  }
+
+  bool withinLimit() {
+    return buffer_.GetSize() <= kLongestMessage || fail("a message is too long");
+  }
+
+  bool fail(const char* problem) {
+    problem_ = problem;
+    return false;
+  }
+
+  bool beginEntry() {
+    hasMessage_ = false;
+    return true;
+  }
+
+  bool beginMessage(std::string_view identifier) {
+    if (hasMessage_) return fail("an entry has more than one message");
+    hasMessage_ = true;
+    identifier_ = identifier;
+    return true;
+  }
+
+  void endMessage() {
+    ++totals_.messages;
+    if (identifier_.starts_with(kVolumeInterval)) ++totals_.volumeIntervals;
+    if (onMessage_) onMessage_(identifier_, {buffer_.GetString(), buffer_.GetSize()});
+    isTimestamp_ = false;
+  }
+
+  void noteTime(const std::string& text) {
+    const double time = std::strtod(text.c_str(), nullptr);
+    if (!firstTime_) firstTime_ = time;
+    totals_.seconds = time - *firstTime_;
+  }
+
+  const SummaryMessageHandler& onMessage_;
+  SummaryTotals& totals_;
+  std::size_t depth_ = 0;
+  bool hasMessage_ = false;
+  bool isTimestamp_ = false;
+  std::string identifier_;
+  std::optional<double> firstTime_;
+  rapidjson::StringBuffer buffer_;
+  rapidjson::Writer<rapidjson::StringBuffer> writer_{buffer_};
+  std::string problem_;
+};
+
+struct CloseFile {
+  void operator()(std::FILE* file) const { static_cast<void>(std::fclose(file)); }
+};
+using File = std::unique_ptr<std::FILE, CloseFile>;
+
+// None, with the reason, for what cannot be read to an end, such as a directory or a pipe.
+File openFile(const std::string& path, std::string& error) {
+  struct stat status {};
+  if (::stat(path.c_str(), &status) != 0) {
+    error = std::strerror(errno);
+    return nullptr;
+  }
+  if (!S_ISREG(status.st_mode)) {
+    error = "is no file";
+    return nullptr;
+  }
+  File file(std::fopen(path.c_str(), "rbe"));
+  if (file == nullptr) error = std::strerror(errno);
+  return file;
+}
+
+}  // namespace
+
+std::optional<SummaryName> parseSummaryName(std::string_view name) {
+  SummaryName parsed;
+  if (!name.ends_with(kEnding)) return std::nullopt;
+  name.remove_suffix(kEnding.size());
+  if (!parseTimeOfName(name.substr(0, kTimePattern.size()), parsed)) return std::nullopt;
+  name.remove_prefix(kTimePattern.size());
+  if (!name.starts_with(kMark)) return std::nullopt;
+  name.remove_prefix(kMark.size());
+  const std::size_t hyphen = name.rfind('-');
+  if (hyphen == std::string_view::npos) return std::nullopt;
+  parsed.application = name.substr(0, hyphen);
+  parsed.service = name.substr(hyphen + 1);
+  return parsed;
+}
+
+bool readSummary(const std::string& path, const SummaryMessageHandler& handler,
+                 SummaryTotals& totals, std::string& error) {
+  constexpr unsigned kFlags = rapidjson::kParseNumbersAsStringsFlag |
+                              rapidjson::kParseIterativeFlag |
+                              rapidjson::kParseValidateEncodingFlag;
+  const File file = openFile(path, error);
+  if (file == nullptr) return false;
+  std::vector<char> buffer(kBufferBytes);
+  rapidjson::FileReadStream stream(file.get(), buffer.data(), buffer.size());
+  SummaryHandler summary(handler, totals);
+  rapidjson::Reader reader;
+  const rapidjson::ParseResult result = reader.Parse<kFlags>(stream, summary);
+  if (std::ferror(file.get()) != 0) {
+    error = "cannot be read";
+    return false;
+  }
+  if (!result.IsError()) return true;
+  error = "is no summary: at byte " + std::to_string(result.Offset()) + ": " +
+          (summary.problem().empty() ? std::string(rapidjson::GetParseError_En(result.Code()))
+                                     : summary.problem());
+  return false;
+}
+
+}  // namespace halvox::tools
