@@ -116,6 +116,17 @@ struct ExtractSnapshot {
   bool force = false;       // replaces files that are there
 };
 
+// Stored records of the other kinds.
+struct ShowRecords {
+  enum class Kind : std::uint8_t { kMetrics, kPower, kLink, kSnapshots };
+  Kind kind = Kind::kLink;
+  ShowEvents selection{};  // its names are those of power events or of the link's services
+  // Numbers that the records have; none: all.
+  std::vector<std::int64_t> ids{};  // of metrics, or of the link's sessions
+  std::vector<std::int64_t> categories{};
+  std::vector<std::int64_t> types{};
+};
+
 // The summaries that the service leaves of its sessions on internal builds.
 struct ShowSummaries {
   std::vector<std::string> files{};  // none: the newest of the service's
@@ -130,7 +141,7 @@ struct CommonOptions {
 };
 
 struct Command {
-  std::variant<Request, RunScript, RunShell, ShowEvents, ShowSummaries, Preferences,
+  std::variant<Request, RunScript, RunShell, ShowEvents, ShowSummaries, ShowRecords, Preferences,
                PostNotification, ShowSnapshot, ExtractSnapshot>
       what;
   CommonOptions options;

@@ -56,8 +56,9 @@ class CommandLineParser {
       addScripts();
       addEvents();
       addSummary();
-      addSettings();
+      addRecords();
       addSnapshots();
+      addSettings();
     } else {
       addScriptRequests();
     }
@@ -154,8 +155,12 @@ class CommandLineParser {
   void addScripts();
   void addEvents();
   void addSummary();
-  void addSettings();
+  void addRecords();
   void addSnapshots();
+  void addSelection(CLI::App& app, const char* records, const char* names);
+  static void addNumbers(CLI::App& app, const char* name, std::vector<std::int64_t>& numbers,
+                         const char* description);
+  void addSettings();
   [[nodiscard]] Preferences makePreferences() const;
   [[nodiscard]] Send makeSend() const;
   static std::string helpOf(const CLI::App& app);
@@ -179,9 +184,10 @@ class CommandLineParser {
   RunScript script_;
   ShowEvents events_;
   ShowSummaries summaries_;
+  ShowRecords records_;
+  ExtractSnapshot snapshot_;
   Preferences preferences_;
   PostNotification notification_;
-  ExtractSnapshot snapshot_;
 };
 
 void CommandLineParser::addSessionRequests() {
@@ -321,42 +327,99 @@ void CommandLineParser::addScripts() {
   onRun(shell, [] { return RunShell{}; });
 }
 
+// What all commands that show stored records take; a null `names` where records have no name.
+void CommandLineParser::addSelection(CLI::App& app, const char* records, const char* names) {
+  const std::string only = std::string("Only ") + records;
+  if (names != nullptr) {
+    app.add_option(names, events_.names,
+                   only + " of names that match this glob pattern; may be given several times")
+        ->type_name("GLOB")
+        ->expected(1)
+        ->take_all();
+  }
+  add(app, "--since", events_.since, parseTimeNow,
+      only + " since then: a date (RFC 3339), seconds since 1970, or an age (90s, 5m, 2h, 3d)")
+      ->type_name("TIME");
+  add(app, "--until", events_.until, parseTimeNow, only + " before then")->type_name("TIME");
+  app.add_option("--last", events_.last, "Only so many, the newest")
+      ->type_name("N")
+      ->check(CLI::NonNegativeNumber);
+  app.add_flag("--follow", events_.follow,
+               std::string("Go on showing ") + records +
+                   " as they come; begins with the last 10 unless --since or --last say otherwise");
+  app.add_option("--database", events_.database,
+                 "The store: a halvox.db or its directory (default: where the service's "
+                 "configuration puts it)")
+      ->type_name("FILE");
+}
+
 void CommandLineParser::addEvents() {
   auto& events = addCommand("events", "Show the events that the service stored, newest last",
                             "halvoxctl events --name 'com.tarno.*' --since 5m --follow");
-  events
-      .add_option("--name", events_.names,
-                  "Only events of names that match this glob pattern; may be given several times")
-      ->type_name("GLOB")
-      ->expected(1)
-      ->take_all();
-  add(events, "--since", events_.since, parseTimeNow,
-      "Only events since then: a date (RFC 3339), seconds since 1970, or an age (90s, 5m, 2h, 3d)")
-      ->type_name("TIME");
-  add(events, "--until", events_.until, parseTimeNow, "Only events before then")->type_name("TIME");
-  events.add_option("--last", events_.last, "Only so many, the newest")
-      ->type_name("N")
-      ->check(CLI::NonNegativeNumber);
-  events.add_flag("--follow", events_.follow,
-                  "Go on showing events as they come; begins with the last 10 unless --since or "
-                  "--last say otherwise");
-  events
-      .add_option("--database", events_.database,
-                  "The store: a halvox.db or its directory (default: where the service's "
-                  "configuration puts it)")
-      ->type_name("FILE");
+  addSelection(events, "events", "--name");
   onRun(events, [this] { return events_; });
 }
 
+// An option of whole numbers, decimal or hexadecimal, that may be given several times.
+void CommandLineParser::addNumbers(CLI::App& app, const char* name,
+                                   std::vector<std::int64_t>& numbers, const char* description) {
+  app.add_option_function<std::vector<std::string>>(
+         name,
+         [&numbers, name](const std::vector<std::string>& texts) {
+           for (const auto& text : texts) {
+             const auto parsed = parseReporterID(text);
+             if (std::holds_alternative<ArgumentError>(parsed)) {
+               throw CLI::ValidationError(
+                   name, "\"" + harmlessText(text) + "\" is no number; expected a whole number");
+             }
+             numbers.push_back(std::get<ReporterID>(parsed));
+           }
+         },
+         description)
+      ->type_name("N")
+      ->expected(1)
+      ->take_all();
+}
+
+void CommandLineParser::addRecords() {
+  const auto finish = [this](CLI::App& app, ShowRecords::Kind kind) {
+    onRun(app, [this, kind] {
+      records_.kind = kind;
+      records_.selection = events_;
+      return records_;
+    });
+  };
+  auto& metrics = addCommand("metrics", "Show the issue metrics that the service stored",
+                             "halvoxctl metrics --id 0x5B0003 --last 5");
+  addNumbers(metrics, "--id", records_.ids, "Only metrics of this identifier");
+  addSelection(metrics, "metrics", nullptr);
+  finish(metrics, ShowRecords::Kind::kMetrics);
+
+  auto& power = addCommand("power", "Show the power events that the service stored",
+                           "halvoxctl power --name 'Oxbow*' --since 1h");
+  addNumbers(power, "--category", records_.categories, "Only events of this category");
+  addSelection(power, "power events", "--name");
+  finish(power, ShowRecords::Kind::kPower);
+
+  auto& link = addCommand("link", "Show the messages that the link's local back-end stored",
+                          "halvoxctl link --session 7 --follow");
+  addNumbers(link, "--session", records_.ids, "Only messages of this session; -1: single ones");
+  addNumbers(link, "--category", records_.categories, "Only messages of this category");
+  addNumbers(link, "--type", records_.types, "Only messages of this type");
+  addSelection(link, "messages", "--service");
+  finish(link, ShowRecords::Kind::kLink);
+}
+
 void CommandLineParser::addSummary() {
-  auto& summary =
-      addCommand("summary", "Show what sessions of internal builds came to",
-                 "halvoxctl summary --last 5", "A single FILE is shown with its messages.");
+  auto& summary = addCommand("summary", "Show what sessions of internal builds came to",
+                             "halvoxctl summary --last 5",
+                             "A single FILE is shown with its messages.");
   auto* last = summary.add_option("--last", summaries_.last,
                                   "Without a FILE: so many, the newest (default: 10)");
   last->type_name("N")->check(CLI::NonNegativeNumber);
   summary
-      .add_option("FILE", summaries_.files, "Summary files (default: the newest of the service's)")
+      .add_option("FILE", summaries_.files,
+                  "Summary files (default: the newest of the service's)")
       ->excludes(last);
   onRun(summary, [this] { return summaries_; });
 }
@@ -411,9 +474,16 @@ Preferences CommandLineParser::makePreferences() const {
 }
 
 void CommandLineParser::addSnapshots() {
-  auto& snapshots = addCommand("snapshots", "Show or unpack what the service captured",
-                               "halvoxctl snapshots show newest");
-  snapshots.require_subcommand(1);
+  auto& snapshots = addCommand("snapshots", "List, show or unpack what the service captured",
+                               "halvoxctl snapshots --last 5\n  halvoxctl snapshots show newest");
+  snapshots.require_subcommand(0, 1);
+  addSelection(snapshots, "snapshots", nullptr);
+  snapshots.callback([this, &snapshots] {
+    // Runs behind the command that may have been chosen below this one.
+    if (snapshots.get_subcommands().empty()) {
+      command_.what = ShowRecords{ShowRecords::Kind::kSnapshots, events_, {}, {}, {}};
+    }
+  });
   const auto addFor = [&](const char* name, const char* summary, const char* example) {
     CLI::App* app = snapshots.add_subcommand(name, summary);
     addConnectionOptions(*app);

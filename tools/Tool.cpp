@@ -10,6 +10,7 @@
 #include "tools/JsonText.h"
 #include "tools/Notify.h"
 #include "tools/Preferences.h"
+#include "tools/Records.h"
 #include "tools/RequestRunner.h"
 #include "tools/Script.h"
 #include "tools/SnapshotFiles.h"
@@ -61,6 +62,9 @@ ExitStatus runCommand(const Command& command, const ToolStreams& streams) {
   }
   if (const auto* extract = std::get_if<ExtractSnapshot>(&command.what)) {
     return extractSnapshot(*extract, form, streams.output, streams.errors);
+  }
+  if (const auto* records = std::get_if<ShowRecords>(&command.what)) {
+    return showRecords(*records, form, streams.output, streams.outputDescriptor, streams.errors);
   }
   if (const auto* summaries = std::get_if<ShowSummaries>(&command.what)) {
     return showSummaries(*summaries, form, streams.output, streams.errors);

@@ -1,0 +1,204 @@
+#include "tools/Records.h"
+
+#include <array>
+#include <cstddef>
+#include <cstdio>
+#include <optional>
+#include <span>
+#include <string_view>
+
+#include "platform/protobuf.h"
+#include "tools/JsonText.h"
+#include "tools/StoreRun.h"
+
+namespace halvox::tools {
+namespace {
+
+using platform::ProtoReader;
+using platform::linux_::EventFollower;
+using platform::linux_::RecordFilter;
+using platform::linux_::RecordTable;
+using platform::linux_::StoredRecord;
+using platform::linux_::StoreReader;
+namespace store = platform::linux_;
+
+constexpr std::int64_t kAudioIssueDetected = 0x5B0003;
+
+const RecordTable& tableOf(ShowRecords::Kind kind) {
+  switch (kind) {
+    case ShowRecords::Kind::kMetrics:
+      return store::kIssueMetrics;
+    case ShowRecords::Kind::kPower:
+      return store::kPowerEvents;
+    case ShowRecords::Kind::kLink:
+      return store::kLinkMessages;
+    case ShowRecords::Kind::kSnapshots:
+      return store::kSnapshots;
+  }
+  return store::kLinkMessages;
+}
+
+const char* commandOf(ShowRecords::Kind kind) {
+  switch (kind) {
+    case ShowRecords::Kind::kMetrics:
+      return "metrics";
+    case ShowRecords::Kind::kPower:
+      return "power";
+    case ShowRecords::Kind::kLink:
+      return "link";
+    case ShowRecords::Kind::kSnapshots:
+      return "snapshots";
+  }
+  return "";
+}
+
+// Field numbers of the metric.
+enum AudioIssueField : std::uint8_t { kTimestamp = 1, kDuration, kIssueType, kNode, kRtaidClient };
+
+// The fields of the metric as a JSON object; none when the bytes are no such message. Strings that
+// are not UTF-8 are mended.
+std::optional<std::string> audioIssueAsJson(const std::string& bytes) {
+  ProtoReader reader(std::as_bytes(std::span(bytes)));
+  std::optional<std::uint64_t> timestamp;
+  std::int32_t duration = 0;
+  std::array<std::string, 3> texts;
+  while (reader.hasMore()) {
+    const ProtoReader::Tag tag = reader.readTag();
+    if (reader.hasError()) break;
+    if (tag.number == kTimestamp) {
+      timestamp = reader.readVarint();
+    } else if (tag.number == kDuration) {
+      duration = static_cast<std::int32_t>(reader.readVarint());
+    } else if (tag.number >= kIssueType && tag.number <= kRtaidClient) {
+      reader.readString(texts[tag.number - kIssueType]);
+    } else if (!reader.skipField(tag.number, tag.wireType)) {
+      break;
+    }
+  }
+  if (reader.hasError()) return std::nullopt;
+  std::string json = "{\"issue_type\":" + tools::quoted(texts[0]) + ",\"node\":" + tools::quoted(texts[1]) +
+                     ",\"rtaid_client\":" + tools::quoted(texts[2]) +
+                     ",\"duration\":" + std::to_string(duration);
+  if (timestamp) json += ",\"timestamp\":" + std::to_string(*timestamp);
+  return json + "}";
+}
+
+std::string hexadecimal(std::string_view bytes) {
+  constexpr std::string_view kDigits = "0123456789abcdef";
+  std::string text;
+  for (const char byte : bytes) {
+    const auto value = static_cast<unsigned char>(byte);
+    text += kDigits[value >> 4U];
+    text += kDigits[value & 0xFU];
+  }
+  return text;
+}
+
+std::string metricID(std::int64_t metric) {
+  std::array<char, 24> text{};
+  std::snprintf(text.data(), text.size(), "0x%llX", static_cast<unsigned long long>(metric));
+  return text.data();
+}
+
+// The time, the number or name that the record goes by, and its fields.
+std::string metricAsText(const StoredRecord& record) {
+  const std::int64_t metric = record.number(store::kMetricID);
+  const std::string& bytes = record.text(store::kMetricMessage);
+  const auto fields = metric == kAudioIssueDetected ? audioIssueAsJson(bytes) : std::nullopt;
+  return metricID(metric) + "  " + (fields ? fieldsOfJson(*fields) : hexadecimal(bytes));
+}
+
+std::string asText(ShowRecords::Kind kind, const StoredRecord& record) {
+  switch (kind) {
+    case ShowRecords::Kind::kMetrics:
+      return metricAsText(record);
+    case ShowRecords::Kind::kPower:
+      return std::to_string(record.number(store::kPowerCategory)) + "  " +
+             harmlessText(record.text(store::kPowerEventName)) + "  " +
+             fieldsOfJson(record.text(store::kPowerPayload));
+    case ShowRecords::Kind::kLink:
+      return std::to_string(record.number(store::kLinkSessionID)) + "  " +
+             harmlessText(record.text(store::kLinkServiceName)) + "  " +
+             std::to_string(record.number(store::kLinkCategory)) + "/" +
+             std::to_string(record.number(store::kLinkType)) + "  " +
+             fieldsOfJson(record.text(store::kLinkPayload));
+    case ShowRecords::Kind::kSnapshots:
+      return harmlessText(record.text(store::kSnapshotPath)) + "  " +
+             fieldsOfJson(record.text(store::kSnapshotSignature));
+  }
+  return {};
+}
+
+// Columns that hold JSON already, on one line and complete: that is the store's promise.
+bool isJson(std::string_view column) { return column == "payload" || column == "signature"; }
+
+std::string asJson(ShowRecords::Kind kind, const StoredRecord& record) {
+  const auto columns = tableOf(kind).columns;
+  std::string json = "{\"time\":" + toJson(record.time);
+  for (std::size_t field = 0; field < columns.size(); ++field) {
+    json.append(",\"").append(columns[field].name).append("\":");
+    switch (columns[field].type) {
+      case store::ColumnType::kInteger:
+        json += std::to_string(record.number(field));
+        break;
+      case store::ColumnType::kText:
+        json += harmlessJson(isJson(columns[field].name) ? record.text(field)
+                                                         : tools::quoted(record.text(field)));
+        break;
+      case store::ColumnType::kBytes:
+        json += tools::quoted(hexadecimal(record.text(field)));
+        break;
+    }
+  }
+  const bool isIssue =
+      kind == ShowRecords::Kind::kMetrics && record.number(store::kMetricID) == kAudioIssueDetected;
+  const auto fields = isIssue ? audioIssueAsJson(record.text(store::kMetricMessage)) : std::nullopt;
+  if (fields) json += ",\"fields\":" + harmlessJson(*fields);
+  return json + "}";
+}
+
+RecordFilter filterOf(const ShowRecords& request) {
+  RecordFilter filter = filterOf(request.selection);
+  const auto add = [&](std::size_t column, const std::vector<std::int64_t>& numbers) {
+    if (!numbers.empty()) filter.numbers.push_back({column, numbers});
+  };
+  switch (request.kind) {
+    case ShowRecords::Kind::kMetrics:
+      add(store::kMetricID, request.ids);
+      break;
+    case ShowRecords::Kind::kPower:
+      add(store::kPowerCategory, request.categories);
+      break;
+    case ShowRecords::Kind::kLink:
+      add(store::kLinkSessionID, request.ids);
+      add(store::kLinkCategory, request.categories);
+      add(store::kLinkType, request.types);
+      break;
+    case ShowRecords::Kind::kSnapshots:
+      break;
+  }
+  return filter;
+}
+
+}  // namespace
+
+std::string formatRecord(ShowRecords::Kind kind, const StoredRecord& record, EventForm form) {
+  return form == EventForm::kJson ? asJson(kind, record)
+                                  : localTime(record.time) + "  " + asText(kind, record);
+}
+
+ExitStatus showRecords(const ShowRecords& request, EventForm form, std::ostream& out,
+                       int outputDescriptor, std::ostream& errors) {
+  const RecordTable& table = tableOf(request.kind);
+  const auto print = [&](const StoredRecord& record) {
+    out << formatRecord(request.kind, record, form) << '\n';
+  };
+  return runOverStore({commandOf(request.kind), request.selection, out, outputDescriptor, errors},
+                      filterOf(request),
+                      {[&](StoreReader& reader, const RecordFilter& filter) {
+                         return reader.forEachRecord(table, filter, print);
+                       },
+                       [&](EventFollower& follower) { return follower.deliver(table, print); }});
+}
+
+}  // namespace halvox::tools

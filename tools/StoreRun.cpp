@@ -1,0 +1,116 @@
+#include "tools/StoreRun.h"
+
+#include <array>
+#include <cmath>
+#include <cstdio>
+#include <ctime>
+#include <filesystem>
+#include <system_error>
+#include <variant>
+
+#include <poll.h>
+
+#include "platform/linux/runtime/Configuration.h"
+#include "tools/JsonText.h"
+
+namespace halvox::tools {
+namespace {
+
+using platform::linux_::EventFollower;
+using platform::linux_::RecordFilter;
+using platform::linux_::StoreError;
+using platform::linux_::StoreReader;
+
+constexpr const char* kDatabaseName = "halvox.db";
+constexpr std::uint64_t kShownWhenFollowing = 10;
+
+// The directory of the store, or how the run ends without one.
+std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& run) {
+  const std::string& database = run.selection.database;
+  std::ostream& errors = run.errors;
+  if (database.empty()) {
+    auto loaded = platform::linux_::loadConfiguration();
+    if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
+      errors << "halvoxctl " << run.command << ": " << harmlessText(error->description) << '\n';
+      return ExitStatus::kBadConfiguration;
+    }
+    return std::get<platform::linux_::Configuration>(loaded).storage.directory;
+  }
+  const std::filesystem::path path(database);
+  std::error_code ignored;
+  if (std::filesystem::is_directory(path, ignored)) return path;
+  if (path.filename() == kDatabaseName) {
+    return path.has_parent_path() ? path.parent_path() : std::filesystem::path(".");
+  }
+  errors << "halvoxctl " << run.command << ": --database: " << harmlessText(database)
+         << " is no store; expected a " << kDatabaseName << " or the directory that has one\n";
+  return ExitStatus::kBadArguments;
+}
+
+ExitStatus complain(const StoreRun& run, const StoreError& error) {
+  run.errors << "halvoxctl " << run.command << ": " << harmlessText(error.description) << '\n';
+  return ExitStatus::kNoService;
+}
+
+// Waits for the next records. False when nobody reads the output any more.
+bool waitForRecords(int storeDescriptor, int outputDescriptor) {
+  std::array<pollfd, 2> polled{{{storeDescriptor, POLLIN, 0}, {outputDescriptor, 0, 0}}};
+  while (poll(polled.data(), polled.size(), -1) < 0) {
+  }
+  return (polled[1].revents & (POLLERR | POLLHUP | POLLNVAL)) == 0;
+}
+
+ExitStatus follow(const StoreRun& run, const std::filesystem::path& directory,
+                  const RecordFilter& filter, const StoreReading& reading) {
+  EventFollower follower;
+  if (const auto error = follower.open(directory, filter)) return complain(run, *error);
+  do {
+    const auto error = reading.added(follower);
+    run.out << std::flush;
+    if (error) return complain(run, *error);
+  } while (run.out && waitForRecords(follower.descriptor(), run.outputDescriptor));
+  return ExitStatus::kDone;
+}
+
+}  // namespace
+
+std::string localTime(double seconds) {
+  const double whole = std::floor(seconds);
+  const auto milliseconds = static_cast<int>((seconds - whole) * 1000);
+  const auto time = static_cast<std::time_t>(whole);
+  std::tm fields{};
+  std::array<char, 64> date{};
+  if (localtime_r(&time, &fields) == nullptr ||
+      std::strftime(date.data(), date.size(), "%Y-%m-%d %H:%M:%S", &fields) == 0) {
+    return std::to_string(seconds);  // so far off that it has no date
+  }
+  std::array<char, 8> fraction{};
+  std::snprintf(fraction.data(), fraction.size(), ".%03d", milliseconds);
+  return std::string(date.data()) + fraction.data();
+}
+
+RecordFilter filterOf(const ShowEvents& selection) {
+  RecordFilter filter;
+  filter.names = selection.names;
+  filter.since = selection.since;
+  filter.until = selection.until;
+  filter.newest = selection.last;
+  if (selection.follow && !selection.since && !selection.last) filter.newest = kShownWhenFollowing;
+  return filter;
+}
+
+ExitStatus runOverStore(const StoreRun& run, const RecordFilter& filter,
+                        const StoreReading& reading) {
+  const auto directory = storeDirectory(run);
+  if (const auto* status = std::get_if<ExitStatus>(&directory)) return *status;
+  const auto& path = std::get<std::filesystem::path>(directory);
+  if (run.selection.follow) return follow(run, path, filter, reading);
+
+  StoreReader reader;
+  if (const auto error = reader.open(path)) return complain(run, *error);
+  const auto error = reading.all(reader, filter);
+  run.out << std::flush;
+  return error ? complain(run, *error) : ExitStatus::kDone;
+}
+
+}  // namespace halvox::tools

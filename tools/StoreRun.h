@@ -1,0 +1,41 @@
+#pragma once
+
+#include <functional>
+#include <optional>
+#include <ostream>
+#include <string>
+
+#include "platform/linux/store/EventFollower.h"
+#include "platform/linux/store/StoreReader.h"
+#include "tools/Command.h"
+
+namespace halvox::tools {
+
+// What a command that shows stored records of one kind is run with.
+struct StoreRun {
+  std::string command;  // for the complaints
+  const ShowEvents& selection;
+  std::ostream& out;
+  int outputDescriptor;  // what `out` writes to
+  std::ostream& errors;
+};
+
+// How the records are read and printed: all that are there, or those that are new.
+struct StoreReading {
+  using Error = std::optional<platform::linux_::StoreError>;
+  std::function<Error(platform::linux_::StoreReader&, const platform::linux_::RecordFilter&)> all;
+  std::function<Error(platform::linux_::EventFollower&)> added;
+};
+
+// What the selection asks for, as the store's reader has it.
+platform::linux_::RecordFilter filterOf(const ShowEvents& selection);
+
+// Opens the store that the selection names and reads it, once or, with --follow, until the output
+// is closed or the store's directory is gone.
+ExitStatus runOverStore(const StoreRun& run, const platform::linux_::RecordFilter& filter,
+                        const StoreReading& reading);
+
+// A moment (seconds since 1970) in local time, to the millisecond.
+std::string localTime(double seconds);
+
+}  // namespace halvox::tools
