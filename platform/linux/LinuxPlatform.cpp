@@ -41,6 +41,13 @@ StoreOptions storeOptions(const Configuration& configuration) {
   return options;
 }
 
+SnapshotOptions snapshotOptions(const Configuration& configuration) {
+  SnapshotOptions options;
+  options.storageDirectory = configuration.storage.directory;
+  options.keep = configuration.keepSnapshots;
+  return options;
+}
+
 std::unique_ptr<KdebugService> makeKdebug(std::string& failure) {
   const std::filesystem::path module = LttngKdebugService::modulePath();
   if (module.empty()) {
@@ -91,6 +98,18 @@ int exitStatus(ConnectionOpenError::Kind kind) {
   return EX_SOFTWARE;
 }
 
+const char* linkName(LinkBackend backend) {
+  switch (backend) {
+    case LinkBackend::kLocal:
+      return "local";
+    case LinkBackend::kNats:
+      return "nats";
+    case LinkBackend::kNone:
+      return "none";
+  }
+  return "";
+}
+
 const char* busName(BusKind kind) {
   switch (kind) {
     case BusKind::kNone:
@@ -112,23 +131,38 @@ LinuxPlatform::LinuxPlatform(const Configuration& configuration)
             ConnectionOptions options = connectionOptions(configuration_);
             options.beginBatch = [this] { dispatch_.beginHelping(); };
             options.endBatch = [this] { dispatch_.endHelping(); };
+            options.onReportSignal = [this] { logStatistics(LogLevel::kDefault, Counters::kAll); };
             return options;
           }(),
           backpressure_),
       kdebug_(makeKdebug(kdebugFailure_)),
-      log_(SpdlogLogService::onStandardError(configuration_.logLevel, statistics_)),
+      log_(SpdlogLogService::onStandardError(
+          {configuration_.logLevel, configuration_.logMemoryLevel}, statistics_)),
       // Its last line tells why the process ended.
       process_([this] { log_->stop(); }),
       deviceProperties_(configuration_.device),
       featureFlags_(configuration_.features),
       store_(storeOptions(configuration_), {clock_, statistics_, backpressure_}),
       analytics_(store_, clock_),
+      diagnosticReporters_(snapshotOptions(configuration_),
+                           {.statistics = statistics_,
+                            .log = [this] { return log_->keptLines(); },
+                            .recorder = &snapshotRecorder_}),
       files_(configuration_.storage.root, statistics_),
       preferenceReader_(configuration_.preferencesDirectory),
       notify_(configuration_.notifyDirectory, preferenceReader_, statistics_),
       preferences_(preferenceReader_, statistics_),
       ioReport_(makeDriverSources(configuration_.drivers), statistics_),
-      dispatch_(*log_, statistics_) {}
+      dispatch_(*log_, statistics_),
+      nats_(configuration_.link.backend == LinkBackend::kNats
+                ? makeNatsTlmReporting(configuration_.link, {dispatch_, statistics_})
+                : nullptr) {}
+
+TLMReportingService& LinuxPlatform::realTimeLink() {
+  if (nats_) return *nats_;
+  if (configuration_.link.backend == LinkBackend::kNone) return noLink_;
+  return localLink_;
+}
 
 Services LinuxPlatform::services() {
   return {.analytics = analytics_,
@@ -152,13 +186,17 @@ Services LinuxPlatform::services() {
           .propertyLists = propertyLists_,
           .resultsFiles = resultsFiles_,
           .statistics = statistics_,
-          .tlmReporting = tlmReporting_};
+          .tlmReporting = realTimeLink()};
 }
 
 std::optional<StartFailure> LinuxPlatform::open() {
+  if (configuration_.link.backend == LinkBackend::kNats && !nats_) {
+    return StartFailure{EX_CONFIG, "link.backend is \"nats\", which is not in this build"};
+  }
   if (const auto error = store_.open()) {
     return StartFailure{exitStatus(error->kind), error->description};
   }
+  diagnosticReporters_.removeLeftovers();
   ioReport_.open();
   if (const auto error = connections_.open()) {
     return StartFailure{exitStatus(error->kind), error->description};
@@ -168,10 +206,12 @@ std::optional<StartFailure> LinuxPlatform::open() {
 }
 
 bool LinuxPlatform::close() {
+  diagnosticReporters_.stop();
   notify_.stop();  // it adds jobs to queues
   const bool ended = dispatch_.stop(kJobsEndWithin);
+  if (nats_) nats_->close();
   store_.close();
-  logStatistics();
+  logStatistics(LogLevel::kInfo, Counters::kCounted);
   log_->stop();
   return ended;
 }
@@ -180,13 +220,16 @@ void LinuxPlatform::logStart() const {
   kLog.notice("serving ", configuration_.listener.socket.string(), ", bus ",
               busName(configuration_.listener.bus), ", store ",
               configuration_.storage.directory.string());
+  kLog.notice("link: ", linkName(configuration_.link.backend), ", in this build: local, ",
+              isNatsBuilt() ? "nats, " : "", "none");
   kLog.notice("trace points: ", kdebugFailure_.empty() ? "LTTng" : "none, LTTng " + kdebugFailure_);
 }
 
-void LinuxPlatform::logStatistics() const {
+void LinuxPlatform::logStatistics(LogLevel level, Counters counters) const {
   for (const CounterReading& reading : statistics_.snapshot()) {
-    if (reading.value == 0) continue;
-    kLog.info("counted ", reading.piece, ", ", reading.name, ": ", reading.value);
+    if (reading.value == 0 && counters == Counters::kCounted) continue;
+    UnitLog::logTo(mainCategory(), "LinuxPlatform", level, "counted ", reading.piece, ", ",
+                   reading.name, ": ", reading.value);
   }
 }
 

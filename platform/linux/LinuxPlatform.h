@@ -5,9 +5,14 @@
 #include <string>
 
 #include "platform/fake/AbsentServices.h"
+#include "platform/linux/SqliteSnapshotRecorder.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
+#include "platform/linux/diagnostics/SnapshotDiagnosticReporterService.h"
 #include "platform/linux/drivers/LinuxIOReportService.h"
 #include "platform/linux/files/RootedFileService.h"
+#include "platform/linux/link/local/LocalTlmReportingService.h"
+#include "platform/linux/link/local/NoneTlmReportingService.h"
+#include "platform/linux/link/nats/NatsTlmReporting.h"
 #include "platform/linux/runtime/AsioDispatchService.h"
 #include "platform/linux/runtime/Backpressure.h"
 #include "platform/linux/runtime/Configuration.h"
@@ -22,6 +27,8 @@
 #include "platform/linux/settings/PreferenceReader.h"
 #include "platform/linux/settings/TomlPreferenceService.h"
 #include "platform/linux/store/SqliteAnalyticsService.h"
+#include "platform/linux/store/SqliteMetricService.h"
+#include "platform/linux/store/SqlitePowerLogService.h"
 #include "platform/linux/store/SqliteStore.h"
 #include "platform/services.h"
 
@@ -54,7 +61,10 @@ class LinuxPlatform {
 
  private:
   void logStart() const;
-  void logStatistics() const;
+  // Those that counted anything, or all, at that level.
+  enum class Counters : std::uint8_t { kCounted, kAll };
+  void logStatistics(LogLevel level, Counters counters) const;
+  TLMReportingService& realTimeLink();
 
   // In the order in which they need each other. The connections come before all that has threads,
   // because they take the end signals from every thread that starts after them.
@@ -71,20 +81,23 @@ class LinuxPlatform {
   ConfiguredFeatureFlagService featureFlags_;
   SqliteStore store_;
   SqliteAnalyticsService analytics_;
-  AbsentDiagnosticReporters diagnosticReporters_;
+  SqliteSnapshotRecorder snapshotRecorder_{store_};
+  SnapshotDiagnosticReporterService diagnosticReporters_;
   RootedFileService files_;
-  AbsentMetrics metrics_;
+  SqliteMetricService metrics_{store_, clock_};
   PreferenceReader preferenceReader_;
   InotifyNotifyService notify_;
-  AbsentPowerLog powerLog_;
+  SqlitePowerLogService powerLog_{store_, clock_};
   TomlPreferenceService preferences_;
-  AbsentTlmReporting tlmReporting_;
+  LocalTlmReportingService localLink_{store_, clock_};
+  NoneTlmReportingService noLink_{statistics_};
   LinuxIOReportService ioReport_;
   AbsentKtrace ktrace_;
   AbsentPerformanceTraces performanceTraces_;
   AbsentPropertyLists propertyLists_;
   AbsentResultsFiles resultsFiles_;
   AsioDispatchService dispatch_;
+  const std::unique_ptr<NatsTlmReporting> nats_;  // only when the link goes there
 };
 
 }  // namespace halvox::platform::linux_
