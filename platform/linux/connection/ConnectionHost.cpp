@@ -81,7 +81,7 @@ std::optional<ConnectionOpenError> ConnectionHost::openLoop() {
     return systemFailure("the event loop");
   }
   if (options_.signals == EndSignals::kLeaveAlone) return std::nullopt;
-  signals_ = std::make_unique<SignalWatch>([this] { stopping_ = true; });
+  signals_ = std::make_unique<SignalWatch>([this] { stopping_ = true; }, options_.onReportSignal);
   if (!signals_->start(loop_)) return systemFailure("the signals");
   return std::nullopt;
 }

@@ -37,6 +37,8 @@ struct ConnectionOptions {
   // that is given on this thread during `endBatch` is written in the same turn.
   std::function<void()> beginBatch;
   std::function<void()> endBatch;
+  // Called on the I/O thread at SIGUSR1, when the signals are handled.
+  std::function<void()> onReportSignal;
 };
 
 // Why nothing can be served.
