@@ -86,6 +86,7 @@ std::vector<std::shared_ptr<HVReportingSession>> sessionsOf(
 HVReportingServiceDelegate::HVReportingServiceDelegate()
     : defaults_((createReportingQueue(), HVReportingDefaults())), features_(makeFeatures()) {
   listenForFeatureStateChanges();
+  offerState();
   if (HVReportingUtilityIsInternalBuild()) {
     vekStateManager_ = std::make_unique<HVReportingUtilityVEKStateManager>();
   }

@@ -76,6 +76,10 @@ class HVReportingServiceDelegate final
  private:
   using Client = std::shared_ptr<HVReportingClientServerInstance>;
 
+  // Lets captures of diagnostics ask for what describeState() gives.
+  void offerState();
+  // All clients and their sessions, as far as there are not too many. On the reporting queue.
+  [[nodiscard]] platform::Dictionary describeState() const;
   Client exportClient(platform::NSXPCConnection& connection);
   void registerClient(const Client& client);
 

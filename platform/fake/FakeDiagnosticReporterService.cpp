@@ -71,14 +71,19 @@ void FakeDiagnosticReporterService::reply(std::size_t index, const Dictionary& r
 }
 
 std::optional<Dictionary> FakeDiagnosticReporterService::state() const {
+  const auto answer = std::make_shared<std::optional<Dictionary>>();
+  askState([answer](const Dictionary& state) { *answer = state; });
+  return *answer;
+}
+
+void FakeDiagnosticReporterService::askState(
+    std::function<void(const Dictionary& state)> callback) const {
   StateSource source;
   {
     const std::lock_guard lock(mutex_);
     source = stateSource_;
   }
-  const auto answer = std::make_shared<std::optional<Dictionary>>();
-  if (source) source([answer](const Dictionary& state) { *answer = state; });
-  return *answer;
+  if (source) source(std::move(callback));
 }
 
 std::shared_ptr<AILDiagnosticReporter> FakeDiagnosticReporterService::createReporter() {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -38,6 +39,8 @@ class FakeDiagnosticReporterService final : public DiagnosticReporterService {
   // The state of the service, as the source that was set gives it; none when no source was set or
   // when it did not answer before it returned.
   [[nodiscard]] std::optional<Dictionary> state() const;
+  // The same for a source that answers later; nothing happens when no source was set.
+  void askState(std::function<void(const Dictionary& state)> callback) const;
 
   [[nodiscard]] std::shared_ptr<AILDiagnosticReporter> createReporter() override;
   void setStateSource(StateSource source) override;
