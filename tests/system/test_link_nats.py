@@ -6,10 +6,11 @@ import threading
 import unittest
 from pathlib import Path
 
-from harness import require, wait_for
+from harness import SERVICE, Service, require, wait_for
 from nats import DRIVER, Driver, Server, SilentServer, cluster, free_ports, numbers_of, read_stream
 
 SUBJECT = "halvox.playback_session"
+APIUSAGE = 12  # the service type of that name
 
 
 def balance(counters):
@@ -21,7 +22,7 @@ class NatsTest(unittest.TestCase):
     @classmethod
     def setUpClass(cls):
         require("nats-server")
-        if not DRIVER.exists():
+        if not DRIVER.exists() or not SERVICE.exists():
             raise unittest.SkipTest("the link to NATS is not in this build")
 
 
@@ -218,6 +219,75 @@ class FailureTest(NatsTest):
             finally:
                 server.process.send_signal(18)
             self.assertEqual(balance(driver.counters), 0)
+
+
+class ServiceTest(NatsTest):
+    """The whole service: sessions of clients end on the stream."""
+
+    @staticmethod
+    def service(url):
+        return Service(config=f'[link]\nbackend = "nats"\nservers = ["{url}"]\n[log]\nlevel = "info"\n')
+
+    @staticmethod
+    def run_session(service, reporter, messages, service_type=1):
+        client = service.client()
+        client.create(reporter)
+        client.set_type(service_type, reporter)
+        client.start_later(reporter)
+        for number in range(messages):
+            client.send({"number": number}, reporters=[reporter])
+        assert client.stop(reporter) is True
+        return client
+
+    def messages_of(self, url, reporter):
+        """The numbered messages, without the summary at the end, in the order of the stream."""
+        return [record["message"] for record in self.try_read(url)
+                if record["subject"].endswith(f".{reporter}")
+                and isinstance(record["message"]["payload"].get("number"), int)]
+
+    @staticmethod
+    def try_read(url):
+        try:
+            return read_stream(url)
+        except AssertionError:  # the stream is not made yet
+            return []
+
+    def test_stop_flushes_the_messages_of_a_session_in_order(self):
+        with Server() as server, self.service(server.url) as service:
+            client = self.run_session(service, 5, 2000)
+            wait_for("the flush", lambda: "flushed halvox." in service.log())
+            messages = self.messages_of(server.url, 5)
+            client.close()
+
+            self.assertTrue([message["payload"]["number"] for message in messages] == list(range(2000)))
+            self.assertIn(" acknowledged, 0 not", service.log())
+            self.assertIn("continuing with backends!", service.log())
+
+    def test_a_session_of_api_usage_is_sent_unbatched(self):
+        with Server() as server, self.service(server.url) as service:
+            client = self.run_session(service, 6, 100, service_type=APIUSAGE)
+            messages = wait_for("the messages", lambda: len(all := self.messages_of(server.url, 6)) == 100 and all)
+            client.close()
+
+            info = messages[0]["sessionInfo"]
+            self.assertIs(info["TLMReportingSessionInfoBatchEvent"], False)
+            self.assertIs(info["TLMReportingSessionInfoContainsRealtimeEvents"], True)
+            self.assertNotIn("flushed halvox.", service.log())
+
+    def test_clients_notice_nothing_of_a_missing_server(self):
+        with self.service(f"nats://127.0.0.1:{free_ports(1)[0]}") as service:
+            client = self.run_session(service, 7, 10)
+            wait_for("the discovery to fail", lambda: "failed to find backend" in service.log())
+            recorded = service.wait_for_events(10)
+            client.close()
+
+            self.assertGreaterEqual(len(recorded), 10)
+            self.assertIn("no backends found, this session won't get sent to the server", service.log())
+
+    def test_the_service_says_which_back_ends_it_has(self):
+        with Server() as server, self.service(server.url) as service:
+            wait_for("the line about the back-ends",
+                     lambda: "link: nats, in this build: local, nats, none" in service.log())
 
 
 class ClusterTest(NatsTest):

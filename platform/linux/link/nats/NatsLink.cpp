@@ -9,7 +9,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(natsLogCategory, "NatsLink.cpp");
+constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 constexpr std::chrono::milliseconds kLibraryEndTime{2000};
 constexpr std::string_view kErrorDomain = "com.tarno.halvox.link";
 

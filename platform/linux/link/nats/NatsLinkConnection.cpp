@@ -8,7 +8,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(natsLogCategory, "NatsLinkConnection.cpp");
+constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
 // One server that accepts and says nothing may take so much of an attempt, all of them together
 // kServersTime, so that the attempt ends before those who wait for it have given up.

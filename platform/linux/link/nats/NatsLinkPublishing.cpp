@@ -7,7 +7,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(natsLogCategory, "NatsLinkPublishing.cpp");
+constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
 // Messages that are published under one hold of the lock before and none while publishing.
 constexpr std::size_t kMessagesAtOnce = 64;

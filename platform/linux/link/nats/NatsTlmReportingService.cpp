@@ -14,7 +14,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(natsLogCategory, "NatsTlmReportingService.cpp");
+constexpr UnitLog kLog(natsLogCategory, "NatsTlmReportingService");
 constexpr const char* kMessageIdHeader = "Nats-Msg-Id";
 // What the header adds to a message, roughly: it counts where a server limits sizes.
 constexpr std::size_t kHeaderBytes = 80;
