@@ -160,6 +160,12 @@ class Startup(unittest.TestCase):
 
 
 class SocketDirectoryAppears(unittest.TestCase):
+    def test_report_signal_logs_all_counters_and_the_service_goes_on(self):
+        with Service() as service:
+            service.process.send_signal(signal.SIGUSR1)
+            wait_for("the counters", lambda: "counted files, files written: 0" in service.log())
+            self.assertTrue(service.client().create(7))
+
     def test_ready_service_says_what_it_is_made_of(self):
         with Service() as service:
             wait_for("the start's line", lambda: "lttng" in service.log().lower())
