@@ -82,11 +82,11 @@ class Reporter:
 
     _numbers = itertools.count()
 
-    def __init__(self, audio, service):
+    def __init__(self, audio, service, *options):
         self.log_path = audio.directory / f"reporter-{next(Reporter._numbers)}.log"
         with open(self.log_path, "ab") as log:
             self.process = subprocess.Popen(
-                [REPORTER, "--socket", service.socket, "--verbose"],
+                [REPORTER, "--socket", service.socket, "--verbose", *options],
                 env=audio.environment, stdin=subprocess.DEVNULL, stdout=log, stderr=log)
         wait_for("the reporter to follow PipeWire", lambda: "following PipeWire" in self.log())
 

@@ -108,11 +108,31 @@ class RealAudioTest(unittest.TestCase):
         stop_process(player)
 
     def test_a_reporter_sleeps_while_its_streams_only_run(self):
+        stop_process(self.reporter.process)
+        self.reporter = self.stack.enter_context(
+            audio.Reporter(self.audio, self.service, "--no-xruns"))
         self.play(30)
         self.wait_for_message("Volume.State")
         wait_for("the reporter to come to rest", lambda: self.wake_ups(seconds=0.5) == 0)
 
         self.assertEqual(self.wake_ups(seconds=3), 0)
+
+    def test_what_a_stalled_player_missed_is_recorded_as_an_issue(self):
+        player = self.play(30)
+        self.wait_for_message("Volume.State")
+        player.send_signal(signal.SIGSTOP)
+        issues = self.wait_for_message("Session_Playback.IssueDetector", 2)
+        player.send_signal(signal.SIGCONT)
+
+        self.assertEqual({(issue["issue_type"], issue["node"], issue["rtaid_client"])
+                          for issue in issues}, {("xrun", "pw-play", "pw-play")})
+        self.assertGreater(min(issue["any_channel_silence_seconds"] for issue in issues), 0)
+
+    def test_watching_for_xruns_wakes_a_few_times_a_second(self):
+        self.play(30)
+        self.wait_for_message("Volume.State")
+
+        self.assertLess(self.wake_ups(seconds=3) / 3, 60)
 
     def wake_ups(self, seconds):
         before = self.reporter.voluntary_switches()
