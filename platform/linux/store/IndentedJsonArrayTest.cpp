@@ -1,6 +1,8 @@
 #include "platform/linux/store/IndentedJsonArray.h"
 
+#include <algorithm>
 #include <cmath>
+#include <cstdint>
 #include <string>
 
 #include <gtest/gtest.h>
