@@ -1,0 +1,72 @@
+"""What a started session sends through the link is in the local store, in order, each once."""
+
+import json
+import os
+import shutil
+import subprocess
+import tempfile
+import unittest
+
+import harness
+from harness import Service, wait_for
+
+MESSAGES = 500
+
+
+def link_messages(service, *arguments):
+    """What halvoxctl link shows of the service's store."""
+    shown = subprocess.run(
+        [os.path.join(os.environ["HALVOX_BIN"], "halvoxctl"), "link", "--json",
+         "--database", str(service.database), *arguments],
+        stdout=subprocess.PIPE, text=True, check=True, timeout=harness.DEADLINE)
+    return [json.loads(line) for line in shown.stdout.splitlines()]
+
+
+def numbers_of(messages):
+    """Of the messages that the client sent; the session adds one of its own at the stop."""
+    return [message["payload"]["number"] for message in messages
+            if message["type"] == harness.START]
+
+
+class LinkLocal(unittest.TestCase):
+    def run_session(self, service):
+        client = service.client()
+        self.addCleanup(client.close)
+        client.create(7)
+        client.set_type(7, 7)
+        started = client.start_later(7)
+        for number in range(MESSAGES):
+            client.send({"number": number}, reporters=[7])
+        client.stop(7)
+        started.wait()
+
+    def test_messages_of_a_session_are_stored_in_order_none_missing_none_twice(self):
+        with Service() as service:
+            self.run_session(service)
+            wait_for("the last message",
+                     lambda: MESSAGES - 1 in numbers_of(link_messages(service)))
+            messages = link_messages(service, "--session", "7")
+
+        self.assertEqual(numbers_of(messages), list(range(MESSAGES)))
+        self.assertEqual({message["client_name"] for message in messages}, {"com.tarno.halvox"})
+        self.assertEqual(len({message["service_name"] for message in messages}), 1)
+        self.assertTrue(messages[0]["service_name"].endswith("_session"))
+        times = [message["time"] for message in messages]
+        self.assertEqual(times, sorted(times))
+
+    def test_end_of_the_service_loses_nothing(self):
+        directory = tempfile.mkdtemp(prefix="halvox-test-")
+        self.addCleanup(shutil.rmtree, directory, True)
+        with Service(directory=directory) as service:
+            self.run_session(service)
+        self.assertEqual(numbers_of(link_messages(service)), list(range(MESSAGES)))
+
+    def test_without_a_backend_nothing_is_stored_and_clients_notice_nothing(self):
+        with Service('[link]\nbackend = "none"\n') as service:
+            self.run_session(service)
+            service.wait_for_events(2 * MESSAGES)
+            self.assertEqual(link_messages(service), [])
+
+
+if __name__ == "__main__":
+    unittest.main()
