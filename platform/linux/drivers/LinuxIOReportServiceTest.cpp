@@ -1,0 +1,286 @@
+#include "platform/linux/drivers/LinuxIOReportService.h"
+
+#include <condition_variable>
+#include <mutex>
+#include <thread>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "platform/fake/FakePlatform.h"
+#include "platform/linux/drivers/DriverTesting.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using namespace std::chrono_literals;
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using testing::MadeSource;
+using testing::makeReading;
+using testing::simpleChannel;
+using ::testing::SizeIs;
+using Clock = std::chrono::steady_clock;
+
+// A source that a test can hold up.
+class Gate {
+ public:
+  void close() { set(false); }
+  void open() { set(true); }
+  void pass() {
+    std::unique_lock lock(mutex_);
+    changed_.wait(lock, [this] { return isOpen_; });
+  }
+
+ private:
+  void set(bool isOpen) {
+    const std::lock_guard lock(mutex_);
+    isOpen_ = isOpen;
+    changed_.notify_all();
+  }
+  std::mutex mutex_;
+  std::condition_variable changed_;
+  bool isOpen_ = true;
+};
+
+class LinuxIOReportServiceTest : public ::testing::Test {
+ protected:
+  LinuxIOReportService& serve(MadeSource::Make make, MadeSource::Make other = {}) {
+    std::vector<std::unique_ptr<DriverSource>> sources;
+    sources.push_back(std::make_unique<MadeSource>(std::move(make)));
+    if (other) sources.push_back(std::make_unique<MadeSource>(std::move(other)));
+    service_ = std::make_unique<LinuxIOReportService>(std::move(sources), platform_.statistics);
+    service_->open();
+    return *service_;
+  }
+
+  IOReportService::Samples sample(const IOReportService::Channels& channels) {
+    std::optional<IOReportError> error;
+    return service_->IOReportCreateSamples(nullptr, channels, error);
+  }
+
+  IOReportService::Channels find(IOReportService::Name group, IOReportService::Name subGroup) {
+    std::optional<IOReportError> error;
+    return service_->IOReportCopyChannelsInGroup(group, subGroup, error);
+  }
+
+  std::vector<std::string> show(const IOReportService::Samples& samples) {
+    std::vector<std::string> lines;
+    service_->IOReportIterate(samples, [&lines](const IOReportChannel& channel) {
+      lines.push_back(testing::describe(channel));
+      return 0;
+    });
+    return lines;
+  }
+
+  FakePlatform platform_;
+  Gate gate_;
+  std::unique_ptr<LinuxIOReportService> service_;
+};
+
+ChannelList::Channel channelIn(std::string group, std::string subGroup) {
+  ChannelDescription channel;
+  channel.group = std::move(group);
+  channel.subGroup = std::move(subGroup);
+  return std::make_shared<const ChannelDescription>(std::move(channel));
+}
+
+TEST_F(LinuxIOReportServiceTest, AGroupIsChosenByItsNamesAndAnAbsentNameMeansAny) {
+  const std::vector channels{channelIn("Speaker", "MCA"), channelIn("Speaker", "Other"),
+                             channelIn("Rx", "MCA")};
+  auto& service = serve([&] { return makeReading(channels, {1, 2, 3}); });
+
+  EXPECT_EQ(service.IOReportGetChannelCount(find("Speaker", std::nullopt)), 2);
+  EXPECT_EQ(service.IOReportGetChannelCount(find(std::nullopt, "MCA")), 2);
+  EXPECT_EQ(service.IOReportGetChannelCount(find("Rx", "MCA")), 1);
+  EXPECT_EQ(service.IOReportGetChannelCount(find(std::nullopt, std::nullopt)), 3);
+  EXPECT_EQ(service.IOReportGetChannelCount(find("Tx", std::nullopt)), 0);
+}
+
+TEST_F(LinuxIOReportServiceTest, AChannelThatComesAfterTheSubscriptionIsSampledToo) {
+  std::vector channels{simpleChannel("Tx", "a")};
+  serve([&] { return makeReading(channels, std::vector<std::uint64_t>(channels.size(), 1)); });
+  const auto found = find("Tx", std::nullopt);
+  std::this_thread::sleep_for(2 * SourceReader::kMoment);  // no reading of before is shared
+
+  channels.push_back(simpleChannel("Tx", "b"));
+
+  EXPECT_THAT(show(sample(found)), ElementsAre("-/Tx/-/a  = 1", "-/Tx/-/b  = 1"));
+}
+
+TEST_F(LinuxIOReportServiceTest, SamplesOfOneMomentShareOneReading) {
+  std::atomic<int> readings{0};
+  const auto channel = simpleChannel("Tx", "a");
+  serve([&] {
+    ++readings;
+    return makeReading({channel}, {1});
+  });
+  const auto found = find("Tx", std::nullopt);
+  std::this_thread::sleep_for(2 * SourceReader::kMoment);
+  readings = 0;
+
+  const auto start = Clock::now();
+  const auto first = sample(found);
+  const auto second = sample(found);
+  const bool isOneMoment = Clock::now() - start < SourceReader::kMoment;
+
+  EXPECT_EQ(readings, isOneMoment ? 1 : readings.load());
+  EXPECT_LE(readings, 2);
+}
+
+TEST_F(LinuxIOReportServiceTest, ASlowSourceIsLeftOutAndTheOthersAreNot) {
+  const auto slow = simpleChannel("Tx", "slow");
+  const auto fast = simpleChannel("Tx", "fast");
+  serve(
+      [this, slow] {
+        gate_.pass();
+        return makeReading({slow}, {1});
+      },
+      [fast] { return makeReading({fast}, {2}); });
+  const auto found = find("Tx", std::nullopt);
+  std::this_thread::sleep_for(2 * SourceReader::kMoment);
+
+  gate_.close();
+  const auto samples = sample(found);
+  gate_.open();
+
+  EXPECT_THAT(show(samples), ElementsAre("-/Tx/-/fast  = 2"));
+}
+
+TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndTheLogTellsItOnce) {
+  serve([&] {
+    gate_.pass();
+    return makeReading({simpleChannel("Tx", "a")}, {1});
+  });
+  const auto found = find("Tx", std::nullopt);
+  std::this_thread::sleep_for(2 * SourceReader::kMoment);
+  gate_.close();
+  (void)sample(found);
+
+  const auto start = Clock::now();
+  for (int round = 0; round < 10; ++round) EXPECT_THAT(show(sample(found)), IsEmpty());
+  const auto time = Clock::now() - start;
+  gate_.open();
+
+  EXPECT_LT(time, SourceReader::kLongestWait);
+  EXPECT_THAT(platform_.log.texts(LogLevel::kError),
+              ElementsAre("the driver counters of made did not come within 50 ms and are left out "
+                          "until they do"));
+}
+
+TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
+  serve([&] {
+    gate_.pass();
+    return makeReading({simpleChannel("Tx", "a")}, {1});
+  });
+  const auto found = find("Tx", std::nullopt);
+  std::this_thread::sleep_for(2 * SourceReader::kMoment);
+  gate_.close();
+  (void)sample(found);
+  gate_.open();
+
+  const auto deadline = Clock::now() + 10s;
+  while (show(sample(found)).empty() && Clock::now() < deadline) std::this_thread::yield();
+
+  EXPECT_THAT(show(sample(found)), SizeIs(1));
+}
+
+TEST_F(LinuxIOReportServiceTest, SourcesAreReadAtOnce) {
+  std::atomic<bool> isOver{true};
+  std::atomic<int> entered{0};
+  const auto meet = [&](const ChannelList::Channel& channel) {
+    ++entered;
+    while (entered < 2 && !isOver) std::this_thread::yield();
+    return makeReading({channel}, {1});
+  };
+  const auto a = simpleChannel("Tx", "a");
+  const auto b = simpleChannel("Tx", "b");
+  serve([&] { return meet(a); }, [&] { return meet(b); });
+  const auto found = find("Tx", std::nullopt);
+  std::this_thread::sleep_for(2 * SourceReader::kMoment);
+  entered = 0;
+  isOver = false;
+
+  const auto samples = sample(found);
+  isOver = true;
+
+  EXPECT_THAT(show(samples), SizeIs(2));
+  service_.reset();
+}
+
+TEST_F(LinuxIOReportServiceTest, TheLeaseIsReleasedWhenNobodyHoldsSamples) {
+  const auto channel = simpleChannel("Tx", "a");
+  std::mutex mutex;
+  std::weak_ptr<void> lease;
+  serve([&] {
+    auto reading = std::make_shared<Reading>(*makeReading({channel}, {1}));
+    reading->lease = std::make_shared<int>();
+    const std::lock_guard lock(mutex);
+    lease = reading->lease;
+    return reading;
+  });
+  const auto isHeld = [&] {
+    const std::lock_guard lock(mutex);
+    return !lease.expired();
+  };
+
+  auto samples = sample(find("Tx", std::nullopt));
+  EXPECT_TRUE(isHeld());
+  samples.reset();
+  // The thread that made the reading may hold it for a moment after it has handed it over.
+  const auto deadline = Clock::now() + 10s;
+  while (isHeld() && Clock::now() < deadline) std::this_thread::yield();
+
+  EXPECT_FALSE(isHeld());
+}
+
+TEST_F(LinuxIOReportServiceTest, ReadingsAskedForAreGivenOrLate) {
+  serve([&] {
+    gate_.pass();
+    return makeReading({}, {});
+  });
+  const auto found = find("Tx", std::nullopt);
+  gate_.close();
+  std::this_thread::sleep_for(2 * SourceReader::kMoment);
+  (void)sample(found);
+  gate_.open();
+
+  const auto counted = platform_.statistics.values("driver source made");
+  EXPECT_EQ(counted.at("readings asked for"),
+            counted.at("readings given") + counted.at("left out: late"));
+}
+
+TEST_F(LinuxIOReportServiceTest, ManyThreadsMaySampleAtOnce) {
+  constexpr int kThreads = 64;
+  const std::vector channels{simpleChannel("Tx", "a"), simpleChannel("Tx", "b")};
+  std::atomic<std::uint64_t> count{0};
+  auto& service = serve([&] {
+    const std::uint64_t now = ++count;
+    return makeReading(channels, {now, now});
+  });
+  const auto found = find("Tx", std::nullopt);
+  std::atomic<int> wrong{0};
+  std::vector<std::jthread> threads;
+
+  for (int thread = 0; thread < kThreads; ++thread) {
+    threads.emplace_back([&] {
+      std::optional<IOReportError> error;
+      const auto before = sample(found);
+      const auto after = sample(found);
+      const auto delta = service.IOReportCreateSamplesDelta(before, after, error);
+      std::vector<std::int64_t> values;
+      service.IOReportIterate(delta, [&values](const IOReportChannel& channel) {
+        values.push_back(channel.integerValue);
+        return 0;
+      });
+      // Both channels of a reading are of one moment.
+      if (values.size() == 2 && values[0] != values[1]) ++wrong;
+    });
+  }
+  threads.clear();
+
+  EXPECT_EQ(wrong, 0);
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

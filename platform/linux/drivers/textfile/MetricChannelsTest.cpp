@@ -1,0 +1,173 @@
+#include "platform/linux/drivers/textfile/MetricChannels.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "platform/linux/drivers/DriverTesting.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+std::vector<std::string> channelsOf(std::string_view text) {
+  auto made = MetricChannels::from(text);
+  if (const auto* error = std::get_if<MetricError>(&made)) {
+    return {"line " + std::to_string(error->line) + ": " + error->what};
+  }
+  std::vector<ChannelList::Channel> channels;
+  std::vector<std::uint64_t> values;
+  for (auto& channel : std::get<std::vector<MetricChannel>>(made)) {
+    channels.push_back(std::make_shared<const ChannelDescription>(channel.description));
+    values.insert(values.end(), channel.values.begin(), channel.values.end());
+  }
+  return testing::describe(testing::samplesOf(testing::makeReading(channels, values)));
+}
+
+TEST(MetricChannelsTest, CountersAndGaugesAreSimpleChannels) {
+  EXPECT_THAT(
+      channelsOf("# TYPE pulses counter\n"
+                 "# UNIT pulses beats\n"
+                 "pulses_total{driver=\"D\",group=\"Haptics\",subgroup=\"Stats\"} 17\n"
+                 "# TYPE level gauge\n"
+                 "level{group=\"Haptics\",channel=\"Peak Level\",unit=\"dB\"} -3.5 1700000000\n"
+                 "# EOF\n"),
+      ElementsAre("D/Haptics/Stats/pulses beats = 17", "-/Haptics/-/Peak Level dB = -4"));
+}
+
+TEST(MetricChannelsTest, TheFormWithoutAnEndIsReadToo) {
+  EXPECT_THAT(channelsOf("# HELP pulses_total All pulses.\n"
+                         "# TYPE pulses_total counter\n"
+                         "\n"
+                         "# a remark\n"
+                         "pulses_total 9223372036854775807\n"),
+              ElementsAre("-/-/-/pulses_total  = 9223372036854775807"));
+}
+
+TEST(MetricChannelsTest, CumulativeBucketsAreTakenApart) {
+  EXPECT_THAT(channelsOf("# TYPE wait histogram\n"
+                         "wait_bucket{group=\"Speaker\",unit=\"us\",le=\"10\"} 0\n"
+                         "wait_bucket{group=\"Speaker\",unit=\"us\",le=\"20.0\"} 4\n"
+                         "wait_bucket{group=\"Speaker\",unit=\"us\",le=\"30\"} 4\n"
+                         "wait_bucket{group=\"Speaker\",unit=\"us\",le=\"+Inf\"} 5\n"
+                         "wait_count{group=\"Speaker\",unit=\"us\"} 5\n"
+                         "wait_sum{group=\"Speaker\",unit=\"us\"} 91.5\n"),
+              ElementsAre("-/Speaker/-/wait us = 0-10:0 10-20:4 20-30:0 30-9223372036854775807:1 "
+                          "min 10 max 9223372036854775807"));
+}
+
+TEST(MetricChannelsTest, AStateSetWithItsCountersIsAStateChannel) {
+  EXPECT_THAT(channelsOf("# TYPE amp stateset\n"
+                         "amp{group=\"TarnoQ7AMP\",amp=\"on\"} 1\n"
+                         "amp{group=\"TarnoQ7AMP\",amp=\"off\"} 0\n"
+                         "# TYPE amp_residency counter\n"
+                         "# UNIT amp_residency ms\n"
+                         "amp_residency_total{group=\"TarnoQ7AMP\",amp=\"on\"} 900\n"
+                         "amp_residency_total{group=\"TarnoQ7AMP\",amp=\"off\"} 100\n"
+                         "# TYPE amp_transitions counter\n"
+                         "amp_transitions_total{group=\"TarnoQ7AMP\",amp=\"on\"} 3\n"
+                         "amp_transitions_total{group=\"TarnoQ7AMP\",amp=\"off\"} 2\n"
+                         "# EOF\n"),
+              ElementsAre("-/TarnoQ7AMP/-/amp ms = on:3:900 off:2:100"));
+}
+
+TEST(MetricChannelsTest, WhatIsNoChannelIsLeftOut) {
+  EXPECT_THAT(channelsOf("untold 3\n"
+                         "# TYPE rpc summary\nrpc{quantile=\"0.5\"} 3\nrpc_sum 3\n"
+                         "# TYPE mode stateset\nmode{mode=\"a\"} 1\n"
+                         "# TYPE absent gauge\nabsent NaN\n"
+                         "# TYPE build info\nbuild_info{version=\"1\"} 1\n"),
+              IsEmpty());
+}
+
+TEST(MetricChannelsTest, EscapesInLabelsAreResolvedAndOtherLabelsNameTheChannel) {
+  EXPECT_THAT(channelsOf("# TYPE a gauge\n"
+                         R"(a { driver = "x\\\"y", port="left", } 1)"
+                         "\n"),
+              ElementsAre("x\\\"y/-/-/a port=left  = 1"));
+}
+
+TEST(MetricChannelsTest, AnExemplarIsPassedOver) {
+  EXPECT_THAT(channelsOf("# TYPE a counter\na_total 1 # {trace=\"}\"} 0.5 1700000000.5\n# EOF"),
+              ElementsAre("-/-/-/a  = 1"));
+}
+
+struct WrongText {
+  const char* name;
+  std::string text;
+  const char* error;
+};
+
+class WrongMetricsTest : public ::testing::TestWithParam<WrongText> {};
+
+TEST_P(WrongMetricsTest, IsRefusedWithItsLine) {
+  EXPECT_THAT(channelsOf(GetParam().text), ElementsAre(GetParam().error));
+}
+
+INSTANTIATE_TEST_SUITE_P(
+    All, WrongMetricsTest,
+    ::testing::Values(
+        WrongText{"HalfWritten", "# TYPE a gauge\na 1\na{x=\"",
+                  "line 3: expected the end of a text in quotes"},
+        WrongText{"CutInANumber", "# TYPE a gauge\na 12",
+                  "line 2: the line has no end: the file is half-written"},
+        WrongText{"BehindTheEnd", "# EOF\na 1\n", "line 2: expected nothing behind # EOF"},
+        WrongText{"NotUtf8", "# TYPE a gauge\na{b=\"\xff\"} 1\n", "line 2: expected UTF-8"},
+        WrongText{"LongLine", "# " + std::string(9000, 'x') + "\n", "line 1: the line is too long"},
+        WrongText{"Twice", "# TYPE a gauge\na{x=\"1\",y=\"2\"} 1\na{y=\"2\",x=\"1\"} 1\n",
+                  "line 3: the value was told before"},
+        WrongText{"TwoTypes", "# TYPE a gauge\n# TYPE a counter\n",
+                  "line 2: the type of a was told before"},
+        WrongText{"LateType", "a 1\n# TYPE a gauge\n",
+                  "line 2: the type of a comes behind its values"},
+        WrongText{"UnknownType", "# TYPE a number\n", "line 1: expected a type of metric"},
+        WrongText{"OtherUnit", "# UNIT a ms\n# UNIT a us\n",
+                  "line 2: another unit of a was told before"},
+        WrongText{"LabelTwice", "a{x=\"1\",x=\"2\"} 1\n", "line 1: the label x is there twice"},
+        WrongText{"WrongEscape", "a{x=\"\\t\"} 1\n",
+                  "line 1: expected \\n, \\\\ or \\\" as the only escapes"},
+        WrongText{"NoNumber", "a one\n", "line 1: expected a number"},
+        WrongText{"NegativeCounter", "# TYPE a counter\na_total -1\n",
+                  "line 2: expected a count, from 0 to 9223372036854775807"},
+        WrongText{"NanCounter", "# TYPE a counter\na_total NaN\n",
+                  "line 2: expected a count, from 0 to 9223372036854775807"},
+        WrongText{"HugeCounter", "# TYPE a counter\na_total 9223372036854775808\n",
+                  "line 2: expected a count, from 0 to 9223372036854775807"},
+        WrongText{"NotCumulative",
+                  "# TYPE a histogram\na_bucket{le=\"1\"} 5\na_bucket{le=\"+Inf\"} 4\n",
+                  "line 3: expected no fewer hits than in the bucket before"},
+        WrongText{"BoundsBackwards",
+                  "# TYPE a histogram\na_bucket{le=\"2\"} 1\na_bucket{le=\"1\"} 1\n",
+                  "line 3: expected a higher bound than that of the bucket before"},
+        WrongText{"NoInfiniteBucket", "# TYPE a histogram\na_bucket{le=\"1\"} 5\na_count 5\n",
+                  "line 2: expected a bucket with le=\"+Inf\""},
+        WrongText{"OtherCount", "# TYPE a histogram\na_bucket{le=\"+Inf\"} 5\na_count 4\n",
+                  "line 3: expected the count of the bucket with le=\"+Inf\""},
+        WrongText{"FractionBound", "# TYPE a histogram\na_bucket{le=\"0.5\"} 5\n",
+                  "line 2: expected a whole number of the unit, or +Inf, as the bucket's bound"},
+        WrongText{"BareHistogram", "# TYPE a histogram\na 5\n",
+                  "line 2: a is no value of a metric of the type of a"},
+        WrongText{"StateWithoutResidency",
+                  "# TYPE a stateset\na{a=\"x\"} 1\n# TYPE a_transitions counter\n"
+                  "a_transitions_total{a=\"x\"} 1\n",
+                  "line 2: expected a counter a_residency"},
+        WrongText{"SameChannel",
+                  "# TYPE a gauge\na{channel=\"x\"} 1\n# TYPE b gauge\nb{channel=\"x\"} 1\n",
+                  "line 4: this channel was told before, in line 2"}),
+    [](const auto& one) { return one.param.name; });
+
+TEST(OpenMetricsTextTest, SizesAreBounded) {
+  std::string labels;
+  for (int label = 0; label < 40; ++label) labels += "l" + std::to_string(label) + "=\"\",";
+  std::string samples;
+  for (int sample = 0; sample <= 20'000; ++sample) samples += "a" + std::to_string(sample) + " 1\n";
+
+  EXPECT_THAT(channelsOf("a{" + labels + "} 1\n"), ElementsAre("line 1: too many labels"));
+  EXPECT_THAT(channelsOf(samples), ElementsAre("line 20001: too many values"));
+  EXPECT_THAT(channelsOf(std::string((1U << 20U) + 1, '\n')),
+              ElementsAre("line 1: the file is too large"));
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_
