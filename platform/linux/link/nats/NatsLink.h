@@ -91,7 +91,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   void putBack(std::vector<OutgoingMessage> messages, std::size_t first) HALVOX_EXCLUDES(mutex_);
   static void onAcknowledged(jsCtx* context, natsMsg* message, jsPubAck* ack, jsPubAckErr* error,
                              void* link);
-  void resolve(natsMsg* message, const jsPubAckErr* error) HALVOX_EXCLUDES(mutex_);
+  void resolve(NatsMessage message, const jsPubAckErr* error) HALVOX_EXCLUDES(mutex_);
   void countFailure(std::uint64_t messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
   void abandon(std::vector<PendingAcks::Entry> entries) HALVOX_EXCLUDES(mutex_);
   void fail(std::deque<OutgoingMessage> messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);

@@ -49,7 +49,7 @@ void NatsLink::publishSome() {
       return putBack(std::move(messages), index);
     }
     const jsPubAckErr error{.Msg = key, .Err = status, .ErrCode = {}, .ErrText = nullptr};
-    resolve(key, &error);
+    resolve(std::move(messages[index].message), &error);
   }
 }
 
@@ -66,15 +66,15 @@ void NatsLink::putBack(std::vector<OutgoingMessage> messages, std::size_t first)
 }
 
 void NatsLink::onAcknowledged(jsCtx*, natsMsg* message, jsPubAck*, jsPubAckErr* error, void* link) {
-  static_cast<NatsLink*>(link)->resolve(message, error);
-  natsMsg_Destroy(message);
+  static_cast<NatsLink*>(link)->resolve(NatsMessage(message), error);
 }
 
-void NatsLink::resolve(natsMsg* message, const jsPubAckErr* error) {
+void NatsLink::resolve(NatsMessage message, const jsPubAckErr* error) {
   std::optional<PendingAcks::Entry> entry;
   {
     const MutexLock lock(mutex_);
-    entry = pending_.take(message);
+    entry = pending_.take(message.get());
+    message.reset();  // before the thread learns that nothing is outstanding, and ends the library
     const bool isAwaited =
         (isWindowFull_ && pending_.isHalfFree()) || (closeBy_ && pending_.size() == 0);
     if (isAwaited) changed_.notifyAll();
