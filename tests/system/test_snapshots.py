@@ -154,7 +154,7 @@ class Snapshots(unittest.TestCase):
                  lambda: snapshots(service) and not list(directory.glob(".*")), WITHIN)
         # Two reports ask once; each was taken or refused, and told so.
         self.assertEqual(service.stop(), 0)
-        counted = dict(re.findall(r"counted snapshots, (.+): (\d+)$", service.log(), re.MULTILINE))
+        counted = dict(re.findall(r"counted diagnostics, (.+): (\d+)$", service.log(), re.MULTILINE))
         taken = int(counted.pop("delivered"))
         self.assertEqual(counted.pop("received"), "5000")
         self.assertEqual(set(counted), {"dropped: another in work"})

@@ -59,11 +59,11 @@ class SnapshotDiagnosticReporterService::Worker {
       : options_(std::move(options)),
         partners_(std::move(partners)),
         directory_(options_.storageDirectory),
-        received_(partners_.statistics.counter("snapshots", "received")),
-        delivered_(partners_.statistics.counter("snapshots", "delivered")),
-        busy_(partners_.statistics.counter("snapshots", "dropped: another in work")),
-        failed_(partners_.statistics.counter("snapshots", "dropped: cannot be written")),
-        ending_(partners_.statistics.counter("snapshots", "dropped: service ending")) {}
+        received_(partners_.statistics.counter("diagnostics", "received")),
+        delivered_(partners_.statistics.counter("diagnostics", "delivered")),
+        busy_(partners_.statistics.counter("diagnostics", "dropped: another in work")),
+        failed_(partners_.statistics.counter("diagnostics", "dropped: cannot be written")),
+        ending_(partners_.statistics.counter("diagnostics", "dropped: service ending")) {}
   ~Worker() { stop(); }
   Worker(const Worker&) = delete;
   Worker& operator=(const Worker&) = delete;

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <charconv>
 #include <cmath>
 #include <cstdint>
 #include <cstdio>
@@ -31,6 +32,7 @@ constexpr std::string_view kStampShape =
     "Z-";
 constexpr std::size_t kLongestPart = 64;
 constexpr int kMostOfOneSecond = 1000;
+constexpr int kLargestNumber = 1'000'000;
 
 std::string stampOf(Date time) {
   const auto seconds = static_cast<std::time_t>(std::floor(time.secondsSince1970));
@@ -66,6 +68,15 @@ void syncDirectory(const fs::path& directory) {
   if (descriptor) ::fsync(descriptor.get());
 }
 
+// 1 for "stamp-rest", n for "stamp-n-rest".
+int numberOf(std::string_view name) {
+  const std::string_view rest = name.substr(kStampShape.size());
+  int number = 1;
+  const auto [end, error] = std::from_chars(rest.data(), rest.data() + rest.size(), number);
+  const bool isNumbered = error == std::errc() && end != rest.data() + rest.size() && *end == '-';
+  return isNumbered ? number : 1;
+}
+
 struct Named {
   std::string stamp;
   std::int64_t modified = 0;  // nanoseconds; orders those of one second
@@ -99,8 +110,16 @@ std::variant<fs::path, SnapshotDirectory::Failure> SnapshotDirectory::publish(
     Date time, std::string_view type, std::string_view subType) const {
   const std::string stamp = stampOf(time);
   const std::string rest = "-" + namePart(type) + "-" + namePart(subType) + std::string(kSuffix);
+  // Behind all that are there: a name that has become free is not used again, since records may
+  // still name it.
+  int first = 1;
+  for (const fs::path& path : newestFirst()) {
+    const std::string name = path.filename().string();
+    if (name.starts_with(stamp))
+      first = std::max(first, std::min(numberOf(name), kLargestNumber) + 1);
+  }
   int error = EEXIST;
-  for (int number = 1; error == EEXIST && number <= kMostOfOneSecond; ++number) {
+  for (int number = first; error == EEXIST && number < first + kMostOfOneSecond; ++number) {
     const fs::path to = path_ / (stamp + (number == 1 ? "" : "-" + std::to_string(number)) + rest);
     error = renameToFree(temporaryPath(), to);
     if (error != 0) continue;

@@ -34,6 +34,14 @@ TEST_F(SnapshotDirectoryTest, SnapshotsOfOneSecondGetNumbersAndNoneIsReplaced) {
   EXPECT_EQ(publish(0), "19700101T000000Z-3-haptics-Generic.tar.zst");
 }
 
+TEST_F(SnapshotDirectoryTest, NameThatHasBecomeFreeIsNotUsedAgain) {
+  publish(0);
+  publish(0);
+  directory.keepNewest(1, directory.path() / "19700101T000000Z-2-haptics-Generic.tar.zst");
+
+  EXPECT_EQ(publish(0), "19700101T000000Z-3-haptics-Generic.tar.zst");
+}
+
 TEST_F(SnapshotDirectoryTest, NamesCannotLeadOutOfTheDirectory) {
   EXPECT_EQ(publish(0, "../../etc", "a/b\nc"), "19700101T000000Z-_._.._etc-a_b_c.tar.zst");
   EXPECT_EQ(namePart(""), "unknown");

@@ -67,7 +67,7 @@ class SnapshotTest : public ::testing::Test {
   // The names in the directory of snapshots, sorted.
   [[nodiscard]] std::vector<std::string> names() const;
   [[nodiscard]] std::uint64_t counted(std::string_view name) const {
-    return platform.statistics.value("snapshots", name);
+    return platform.statistics.value("diagnostics", name);
   }
   void expectBalance() const {
     EXPECT_EQ(counted("received"), counted("delivered") + counted("dropped: another in work") +
