@@ -21,7 +21,9 @@ platform::Counter& startRepliesDropped() {
 }  // namespace
 
 HVReportingSession::HVReportingSession(ReporterID reporterID, ProcessIdentifiers processIdentifiers)
-    : reporterID_(reporterID), processIdentifiers_(std::move(processIdentifiers)) {
+    : reporterID_(reporterID),
+      mTraceDispatchSemaphore_(platform::dispatch().createSemaphore(0)),
+      processIdentifiers_(std::move(processIdentifiers)) {
   kSessionLog.info("created reporting session for ID: ", number(reporterID_));
   emitTracePoint(ReportingTracePoint::kSessionCreated);
 }
@@ -127,6 +129,7 @@ void HVReportingSession::start() {
   history_.set(MessageHistory());
   emitTracePoint(ReportingTracePoint::kSessionStarted);
   if (tlmReportingEnabled()) submitLinkStart();
+  startTracing();
 }
 
 void HVReportingSession::stop() {
@@ -138,6 +141,7 @@ void HVReportingSession::stop() {
   writeSummaryJson();
   sendSummaryEvent();
   if (tlmReportingEnabled()) submitLinkStop();
+  stopTracing();
   // Taken out under the lock but destroyed without it: a long history takes its time.
   const std::optional<MessageHistory> history = history_.take();
   charge(history.has_value() ? history->memorySize() : 0, 0);

@@ -11,6 +11,7 @@
 
 #include "backends/HVReportingVocabulary.h"
 #include "platform/dispatch.h"
+#include "platform/performance_trace.h"
 #include "platform/process.h"
 #include "platform/tlm_reporting.h"
 #include "platform/value.h"
@@ -21,6 +22,9 @@
 #include "session/ResourceAccount.h"
 
 namespace halvox {
+
+class TraceRunner;
+struct TraceParams;
 
 // Keys of a message that are offered to clients. Nothing in the service reads them: no field is
 // left out of comparisons and nothing is held back for a time on their account. Their established
@@ -38,7 +42,8 @@ inline constexpr std::string_view kHVReportingSessionThrottleSecondsKey = "_thro
 // and analytics payloads that still need it; so it is always held by a shared pointer. Every
 // property may be read and written from any thread, one indivisible access at a time. No operation
 // fails.
-class HVReportingSession : public std::enable_shared_from_this<HVReportingSession> {
+class HVReportingSession : public platform::KQTraceSessionDelegate,
+                           public std::enable_shared_from_this<HVReportingSession> {
  public:
   using ProcessIdentifiers = std::vector<platform::ProcessID>;
   // The history, locked: there is one exactly while the session is started.
@@ -47,7 +52,7 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   HVReportingSession(ReporterID reporterID, ProcessIdentifiers processIdentifiers);
   HVReportingSession(const HVReportingSession&) = delete;
   HVReportingSession& operator=(const HVReportingSession&) = delete;
-  ~HVReportingSession();
+  ~HVReportingSession() override;
 
   // From now on what the session holds is charged to that account, until the session is gone. At
   // most once, before anything else is done with the session.
@@ -98,6 +103,39 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   [[nodiscard]] BoolReply transactionCompleteBlock() const;
   void setTransactionCompleteBlock(BoolReply block);
   [[nodiscard]] BoolReply takeTransactionCompleteBlock();
+
+  // Traces of test sessions. Whether one is being recorded: from a start that began one to the
+  // stop.
+  [[nodiscard]] bool startedTracing() const {
+    return startedTracing_.load(std::memory_order_acquire);
+  }
+  void setStartedTracing(bool started) {
+    startedTracing_.store(started, std::memory_order_release);
+  }
+  // The trace parameters file that was last set up, what it said, and the runner made from it.
+  [[nodiscard]] std::string tracingFileName() const { return tracing_.lock()->fileName; }
+  [[nodiscard]] std::shared_ptr<const TraceParams> traceParams() const {
+    return tracing_.lock()->params;
+  }
+  [[nodiscard]] std::shared_ptr<TraceRunner> traceRunner() const { return tracing_.lock()->runner; }
+  // The trace of the framework that is being recorded; null when there is none.
+  [[nodiscard]] std::shared_ptr<platform::KQTraceConfig> traceConfig() const {
+    return tracing_.lock()->config;
+  }
+  [[nodiscard]] std::shared_ptr<platform::KQTraceSession> traceSession() const {
+    return tracing_.lock()->session;
+  }
+  // Where the last finished trace of the framework is; none before one has finished.
+  [[nodiscard]] std::optional<std::string> getKQTraceFileURL() const {
+    return tracing_.lock()->finalURL;
+  }
+  // Reads a trace parameters file and makes a runner of it. What goes wrong is logged; an empty
+  // path makes none. Waits for the disk.
+  void setupTracing(const std::string& path);
+  void kqTraceDidStart(const std::optional<platform::Error>& error) override;
+  void kqTraceDidStop(const std::optional<platform::Error>& error) override;
+  void kqTraceDidComplete(const std::string& url, std::uint64_t token,
+                          const std::optional<platform::Error>& error) override;
 
   // The configuration as it is now, empty if none was set. Every call sees the newest state, and no
   // later change alters what it returned.
@@ -186,12 +224,29 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   void sendThroughLink(const LinkMessage& message);
   void sendAsSingleMessage(const LinkMessage& message);
 
+  // Both do nothing unless tracing is switched on and this is a test session. The stop blocks until
+  // what was traced is complete.
+  void startTracing();
+  void startFrameworkTrace();
+  void stopTracing();
+
   void sendVolumeMessages();
   void sendSummaryEvent();
   [[nodiscard]] std::string summaryFileName() const;
   [[nodiscard]] std::size_t historySize() const;
 
+  struct Tracing {
+    std::string fileName{};
+    std::shared_ptr<const TraceParams> params{};
+    std::shared_ptr<TraceRunner> runner{};
+    std::shared_ptr<platform::KQTraceConfig> config{};
+    std::shared_ptr<platform::KQTraceSession> session{};
+    std::optional<std::string> finalURL{};
+  };
+
   const ReporterID reporterID_;
+  // Signalled when a trace of the framework has completed.
+  const std::shared_ptr<platform::DispatchSemaphore> mTraceDispatchSemaphore_;
   std::shared_ptr<ResourceAccount> account_;  // null: nobody is charged
   std::atomic<std::size_t> chargedBytes_{0};  // orders with nothing: the sum of what was charged
   Guarded<ProcessIdentifiers> processIdentifiers_;
@@ -199,6 +254,8 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   Guarded<std::optional<MessageHistory>> history_;
   Guarded<BoolReply> transactionCompleteBlock_;
   Guarded<std::optional<DriverSnapShot>> driverSnapShot_;
+  Guarded<Tracing> tracing_;
+  std::atomic<bool> startedTracing_{false};  // orders what the start of a trace wrote
   std::once_flag tlmReportingQueueMade_;
   std::shared_ptr<platform::DispatchQueue> tlmReportingQueue_;
   std::once_flag backendSemaphoreMade_;

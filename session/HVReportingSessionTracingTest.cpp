@@ -1,0 +1,271 @@
+#include <memory>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "platform/fake/FakePlatform.h"
+#include "session/HVReportingSession.h"
+#include "session/TraceConstants.h"
+#include "tracing/TraceRunner.h"
+
+namespace halvox {
+namespace {
+
+using platform::Array;
+using platform::Dictionary;
+using platform::Error;
+using platform::JournalKind;
+using platform::LogLevel;
+using platform::Value;
+using Texts = std::vector<std::string>;
+
+constexpr const char* kFile = "/params.plist";
+
+class HVReportingSessionTracingTest : public testing::Test {
+ protected:
+  HVReportingSessionTracingTest() {
+    platform_.featureFlags.set("Acoustat", "Tracing", platform::FakeFeatureFlagService::State::kOn);
+    platform_.propertyLists.setFile(
+        kFile, Dictionary{{"Children", Array{Dictionary{{"Name", "T"}, {"Children", Array{}}}}}});
+    session_->setServiceType(AudioServiceType::kTest);
+    forgetWhatHappened();
+  }
+  void forgetWhatHappened() {
+    platform_.journal.clear();
+    platform_.log.clear();
+  }
+  void chooseRunner() {
+    session_->setConfiguration(Dictionary{{HVReportingTraceType, HVReportingTraceTypeKtrace},
+                                          {HVReportingMeridelPlistFilePath, kFile}});
+  }
+  // The operations of both back-ends.
+  Texts operations() const { return platform_.journal.texts(JournalKind::kNote); }
+  // The lines of that level about traces, those of the start hook included.
+  Texts lines(LogLevel level, std::string_view category) const {
+    Texts texts;
+    for (const auto& line : platform_.log.lines(level)) {
+      if (line.category == category) texts.push_back(line.text);
+    }
+    return texts;
+  }
+
+  platform::FakePlatform platform_;
+  std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
+};
+
+const Texts kFrameworkStart{"trace configuration", "trace session", "trace delegate",
+                            "trace start"};
+
+// --- Choosing -----------------------------------------------------------------------------------
+
+TEST_F(HVReportingSessionTracingTest, WithoutTheFeatureNothingIsTraced) {
+  platform_.featureFlags.set("Acoustat", "Tracing", platform::FakeFeatureFlagService::State::kOff);
+  chooseRunner();
+
+  session_->start();
+  session_->stop();
+
+  EXPECT_TRUE(operations().empty());
+  EXPECT_FALSE(session_->startedTracing());
+}
+
+TEST_F(HVReportingSessionTracingTest, OnlyTestSessionsTrace) {
+  for (const auto type : {AudioServiceType::kHaptics, AudioServiceType::kUnknown}) {
+    session_->setServiceType(type);
+    chooseRunner();
+
+    session_->start();
+    session_->stop();
+  }
+  EXPECT_TRUE(operations().empty());
+}
+
+TEST_F(HVReportingSessionTracingTest, WithoutATraceTypeTheFrameworkIsChosen) {
+  session_->start();
+
+  EXPECT_EQ(operations(), kFrameworkStart);
+  EXPECT_EQ(platform_.performanceTraces.templates(), std::vector<std::int32_t>{1});
+  EXPECT_TRUE(session_->startedTracing());
+}
+
+TEST_F(HVReportingSessionTracingTest, AnyOtherTraceTypeChoosesTheFramework) {
+  session_->setConfiguration(Dictionary{{HVReportingTraceType, HVReportingTraceTypeArtrace},
+                                        {HVReportingMeridelPlistFilePath, kFile}});
+
+  session_->start();
+
+  EXPECT_EQ(operations(), kFrameworkStart);
+  EXPECT_EQ(session_->traceRunner(), nullptr);
+}
+
+TEST_F(HVReportingSessionTracingTest, ATypeInsideAnArrayChoosesTheFramework) {
+  session_->setConfiguration(Dictionary{{HVReportingTraceType, Array{HVReportingTraceTypeKtrace}}});
+
+  session_->start();
+
+  EXPECT_EQ(operations(), kFrameworkStart);
+}
+
+// --- The runner ---------------------------------------------------------------------------------
+
+TEST_F(HVReportingSessionTracingTest, RunnerRecordsFromStartToStop) {
+  chooseRunner();
+
+  session_->start();
+  EXPECT_TRUE(session_->startedTracing());
+  EXPECT_EQ(session_->tracingFileName(), kFile);
+  EXPECT_EQ(session_->traceParams()->name, "T");
+  EXPECT_EQ(session_->traceRunner()->getNumTraces(), 1U);
+  session_->stop();
+
+  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_EQ(operations(),
+            (Texts{"ktrace create", "ktrace completion handler", "ktrace wall times on",
+                   "ktrace range 0x21040000 to 0x2104408A", "ktrace start", "ktrace end 0",
+                   "ktrace destroy", "results open", "results close"}));
+  EXPECT_EQ(platform_.resultsFiles.files().size(), 1U);
+}
+
+TEST_F(HVReportingSessionTracingTest, SettingUpTheRunnerIsLoggedByTheSession) {
+  chooseRunner();
+
+  session_->start();
+
+  EXPECT_THAT(lines(LogLevel::kDebug, "hvrr"),
+              testing::Contains("Got the tracefile /params.plist, setting up trace"));
+  EXPECT_THAT(lines(LogLevel::kInfo, "hvrr"), testing::Contains("Setting up tracing for test"));
+  session_->stop();
+}
+
+TEST_F(HVReportingSessionTracingTest, WithoutAPathTheRunnerDoesNotStart) {
+  session_->setConfiguration(Dictionary{{HVReportingTraceType, HVReportingTraceTypeKtrace}});
+
+  session_->start();
+  EXPECT_FALSE(session_->startedTracing());
+  session_->stop();
+
+  EXPECT_TRUE(operations().empty());
+}
+
+TEST_F(HVReportingSessionTracingTest, EmptyPathIsLoggedAndNothingStarts) {
+  session_->setConfiguration(Dictionary{{HVReportingTraceType, HVReportingTraceTypeKtrace},
+                                        {HVReportingMeridelPlistFilePath, ""}});
+
+  session_->start();
+
+  EXPECT_THAT(lines(LogLevel::kError, "hvrr"),
+              testing::ElementsAre("TracefileName empty. Failed to setup tracing"));
+  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_TRUE(operations().empty());
+}
+
+TEST_F(HVReportingSessionTracingTest, SecondStartDoesNotTraceAgain) {
+  chooseRunner();
+  session_->start();
+  forgetWhatHappened();
+
+  session_->start();
+
+  EXPECT_TRUE(operations().empty());
+  session_->stop();
+}
+
+TEST_F(HVReportingSessionTracingTest, NextRunMakesANewRunner) {
+  chooseRunner();
+  session_->start();
+  const auto first = session_->traceRunner();
+  session_->stop();
+
+  session_->start();
+
+  EXPECT_NE(session_->traceRunner(), first);
+  session_->stop();
+}
+
+// --- The framework ------------------------------------------------------------------------------
+
+TEST_F(HVReportingSessionTracingTest, FrameworkTraceEndsWithItsURL) {
+  platform_.performanceTraces.completeAtStop("file:///traces/one");
+  session_->start();
+  forgetWhatHappened();
+
+  session_->stop();
+
+  EXPECT_EQ(operations(), (Texts{"trace stop", "trace without delegate"}));
+  EXPECT_EQ(session_->getKQTraceFileURL(), "file:///traces/one");
+  EXPECT_EQ(session_->traceSession(), nullptr);
+  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_EQ(lines(LogLevel::kInfo, "hvrt"),
+            (Texts{"Performance Trace Stopped", "Performance Trace Completed: /traces/one"}));
+}
+
+TEST_F(HVReportingSessionTracingTest, StartOfATraceIsToldInTheGeneralLogToo) {
+  session_->start();
+
+  platform_.performanceTraces.delegate()->kqTraceDidStart(std::nullopt);
+
+  EXPECT_EQ(lines(LogLevel::kInfo, "hvrt"), Texts{"Performance Trace Started"});
+  ASSERT_EQ(lines(LogLevel::kDefault, "general").size(), 1U);
+  EXPECT_EQ(platform_.log.lines(LogLevel::kDefault).back().line, "started performance trace.");
+}
+
+TEST_F(HVReportingSessionTracingTest, FailedStartClearsTheTraceButStaysStarted) {
+  session_->start();
+  const auto delegate = platform_.performanceTraces.delegate();
+
+  delegate->kqTraceDidStart(Error{.description = "no recorder"});
+
+  EXPECT_EQ(session_->traceSession(), nullptr);
+  EXPECT_EQ(session_->traceConfig(), nullptr);
+  EXPECT_TRUE(session_->startedTracing());
+  EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidStart no recorder"});
+}
+
+TEST_F(HVReportingSessionTracingTest, StopAfterAFailedStartWaitsForWhatNeverComes) {
+  session_->start();
+  platform_.performanceTraces.delegate()->kqTraceDidStart(Error{.description = "no recorder"});
+  forgetWhatHappened();
+
+  // The fake throws where a thread would stand still for ever.
+  EXPECT_THROW(session_->stop(), std::logic_error);
+
+  EXPECT_TRUE(operations().empty());
+}
+
+TEST_F(HVReportingSessionTracingTest, FailedStopClearsTheTrace) {
+  session_->start();
+
+  platform_.performanceTraces.delegate()->kqTraceDidStop(Error{.description = "disk"});
+
+  EXPECT_EQ(session_->traceSession(), nullptr);
+  EXPECT_NE(session_->traceConfig(), nullptr);
+  EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidStop disk"});
+}
+
+TEST_F(HVReportingSessionTracingTest, CompletionWithAnErrorEndsTheWaitWithoutAURL) {
+  session_->start();
+  platform_.performanceTraces.delegate()->kqTraceDidComplete("", 0,
+                                                             Error{.description = "not saved"});
+
+  session_->stop();  // would stand still without the signal
+
+  EXPECT_EQ(session_->getKQTraceFileURL(), std::nullopt);
+  EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidComplete not saved"});
+}
+
+TEST_F(HVReportingSessionTracingTest, BackEndIsChosenAgainAtTheStop) {
+  session_->start();
+  platform_.performanceTraces.completeAtStop("file:///one");
+  chooseRunner();  // the framework records, but now the runner is chosen, and there is none
+  forgetWhatHappened();
+
+  session_->stop();
+
+  EXPECT_TRUE(operations().empty());
+  EXPECT_FALSE(session_->startedTracing());
+}
+
+}  // namespace
+}  // namespace halvox
