@@ -133,6 +133,12 @@ struct ShowSummaries {
   std::uint64_t last = 10;
 };
 
+// The driver channels that there are.
+struct ShowDrivers {
+  std::string group{};  // empty: all
+  std::optional<std::chrono::milliseconds> watch{};
+};
+
 // What all commands take.
 struct CommonOptions {
   bool json = false;
@@ -142,7 +148,7 @@ struct CommonOptions {
 
 struct Command {
   std::variant<Request, RunScript, RunShell, ShowEvents, ShowSummaries, ShowRecords, Preferences,
-               PostNotification, ShowSnapshot, ExtractSnapshot>
+               PostNotification, ShowSnapshot, ExtractSnapshot, ShowDrivers>
       what;
   CommonOptions options;
 };

@@ -59,6 +59,7 @@ class CommandLineParser {
       addRecords();
       addSnapshots();
       addSettings();
+      addDrivers();
     } else {
       addScriptRequests();
     }
@@ -161,6 +162,7 @@ class CommandLineParser {
   static void addNumbers(CLI::App& app, const char* name, std::vector<std::int64_t>& numbers,
                          const char* description);
   void addSettings();
+  void addDrivers();
   [[nodiscard]] Preferences makePreferences() const;
   [[nodiscard]] Send makeSend() const;
   static std::string helpOf(const CLI::App& app);
@@ -188,6 +190,7 @@ class CommandLineParser {
   ExtractSnapshot snapshot_;
   Preferences preferences_;
   PostNotification notification_;
+  ShowDrivers drivers_;
 };
 
 void CommandLineParser::addSessionRequests() {
@@ -422,6 +425,29 @@ void CommandLineParser::addSummary() {
                   "Summary files (default: the newest of the service's)")
       ->excludes(last);
   onRun(summary, [this] { return summaries_; });
+}
+
+void CommandLineParser::addDrivers() {
+  auto& drivers = addCommand("drivers", "Show what the audio drivers count, without the service",
+                             "halvoxctl drivers --group Tx --watch 2");
+  drivers.add_option("--group", drivers_.group, "Only the channels of this group")
+      ->type_name("GROUP");
+  drivers
+      .add_option_function<std::vector<std::string>>(
+          "--watch",
+          [this](const std::vector<std::string>& texts) {
+            drivers_.watch = std::chrono::seconds(1);
+            if (texts.empty() || texts.front().empty()) return;
+            const auto parsed = parseSeconds(texts.front());
+            if (const auto* error = std::get_if<ArgumentError>(&parsed)) {
+              throw CLI::ValidationError("--watch", error->message);
+            }
+            drivers_.watch = std::get<std::chrono::milliseconds>(parsed);
+          },
+          "Show what they change by per second, again and again (default: every second)")
+      ->expected(0, 1)
+      ->type_name("SECONDS");
+  onRun(drivers, [this] { return drivers_; });
 }
 
 void CommandLineParser::addSettings() {

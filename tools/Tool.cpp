@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "tools/CommandLine.h"
+#include "tools/Drivers.h"
 #include "tools/Events.h"
 #include "tools/JsonText.h"
 #include "tools/Notify.h"
@@ -65,6 +66,9 @@ ExitStatus runCommand(const Command& command, const ToolStreams& streams) {
   }
   if (const auto* records = std::get_if<ShowRecords>(&command.what)) {
     return showRecords(*records, form, streams.output, streams.outputDescriptor, streams.errors);
+  }
+  if (const auto* drivers = std::get_if<ShowDrivers>(&command.what)) {
+    return showDrivers(*drivers, form, streams.output, streams.outputDescriptor, streams.errors);
   }
   if (const auto* summaries = std::get_if<ShowSummaries>(&command.what)) {
     return showSummaries(*summaries, form, streams.output, streams.errors);

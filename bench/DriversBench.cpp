@@ -1,0 +1,191 @@
+// What driver statistics cost: 500 channels in text files, in eight groups that are sampled one
+// after the other as a session's start and stop do, by 64 sessions at once.
+
+#include <algorithm>
+#include <array>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <latch>
+#include <map>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/linux/drivers/DriverSourceLog.h"
+#include "platform/linux/drivers/LinuxIOReportService.h"
+#include "platform/linux/drivers/textfile/TextfileSource.h"
+#include "platform/linux/runtime/CounterStatisticsService.h"
+
+namespace {
+
+using namespace halvox::platform;
+using namespace halvox::platform::linux_;
+using Clock = std::chrono::steady_clock;
+
+constexpr int kChannels = 500;
+constexpr int kChannelsPerFile = 10;
+constexpr int kSessions = 64;
+constexpr std::array kGroups{
+    "TarnoQ7AMP", "Speaker", "MCA", "Haptics", "StateTransitionTimes_ms", "Rx", "Tx", "IOSndFam2"};
+
+// Tells when a reading came too late, because then what is measured is not what it should be.
+class ShownLog final : public LogCategory {
+ public:
+  ShownLog() : LogCategory(LogLevel::kError) {}
+  void write(LogLevel /*level*/, std::string_view line) override {
+    std::fprintf(stderr, "%.*s\n", static_cast<int>(line.size()), line.data());
+  }
+};
+
+using SnapShot = std::vector<IOReportService::Samples>;
+
+void writeFiles(const std::filesystem::path& directory, int round) {
+  for (int file = 0; file < kChannels / kChannelsPerFile; ++file) {
+    std::ofstream out(directory / (std::to_string(file) + ".prom"));
+    for (int channel = 0; channel < kChannelsPerFile; ++channel) {
+      out << "# TYPE c" << channel << " counter\n"
+          << "c" << channel << "_total{driver=\"D" << file << "\",group=\""
+          << kGroups.at(static_cast<std::size_t>(channel) % kGroups.size()) << "\"} " << round
+          << "\n";
+    }
+  }
+}
+
+// Samples as a session does.
+class Sampler {
+ public:
+  explicit Sampler(LinuxIOReportService& service) : service_(service) {
+    std::optional<IOReportError> error;
+    for (const char* group : kGroups) {
+      channels_.push_back(service_.IOReportCopyChannelsInGroup(group, std::nullopt, error));
+    }
+  }
+  SnapShot snapShot() const {
+    SnapShot samples;
+    std::optional<IOReportError> error;
+    for (const auto& channels : channels_) {
+      samples.push_back(service_.IOReportCreateSamples(nullptr, channels, error));
+    }
+    return samples;
+  }
+  // Samples again, and goes through all differences.
+  std::size_t report(const SnapShot& before) const {
+    std::size_t count = 0;
+    std::optional<IOReportError> error;
+    for (std::size_t group = 0; group < channels_.size(); ++group) {
+      const auto now = service_.IOReportCreateSamples(nullptr, channels_[group], error);
+      service_.IOReportIterate(service_.IOReportCreateSamplesDelta(before[group], now, error),
+                               [&count](const IOReportChannel&) {
+                                 ++count;
+                                 return 0;
+                               });
+    }
+    return count;
+  }
+
+ private:
+  LinuxIOReportService& service_;
+  std::vector<IOReportService::Channels> channels_;
+};
+
+double milliseconds(Clock::duration time) {
+  return std::chrono::duration<double, std::milli>(time).count();
+}
+
+void tell(const char* what, std::vector<double>& times) {
+  std::ranges::sort(times);
+  std::printf("%-42s median %8.3f ms, p95 %8.3f ms, worst %8.3f ms\n", what,
+              times[times.size() / 2], times[times.size() * 95 / 100], times.back());
+}
+
+void measureOne(const Sampler& sampler) {
+  std::vector<double> snapShots;
+  std::vector<double> reports;
+  for (int round = 0; round < 200; ++round) {
+    std::this_thread::sleep_for(SourceReader::kMoment);
+    const auto start = Clock::now();
+    const SnapShot before = sampler.snapShot();
+    snapShots.push_back(milliseconds(Clock::now() - start));
+    std::this_thread::sleep_for(SourceReader::kMoment);
+    const auto stop = Clock::now();
+    if (sampler.report(before) != kChannels) std::abort();
+    reports.push_back(milliseconds(Clock::now() - stop));
+  }
+  tell("snapshot, one session", snapShots);
+  tell("report, one session", reports);
+}
+
+// All sessions start and stop on one queue, as those of the service do.
+void measureQueue(const Sampler& sampler, const std::filesystem::path& directory) {
+  std::vector<double> snapShots;
+  std::vector<double> reports;
+  for (int round = 0; round < 20; ++round) {
+    std::vector<SnapShot> sessions;
+    for (int session = 0; session < kSessions; ++session) {
+      const auto start = Clock::now();
+      sessions.push_back(sampler.snapShot());
+      snapShots.push_back(milliseconds(Clock::now() - start));
+    }
+    writeFiles(directory, round + 2);
+    for (const SnapShot& session : sessions) {
+      const auto start = Clock::now();
+      if (sampler.report(session) != kChannels) std::abort();
+      reports.push_back(milliseconds(Clock::now() - start));
+    }
+  }
+  tell("snapshot, 64 sessions on one queue", snapShots);
+  tell("report, 64 sessions, files rewritten", reports);
+}
+
+void measureThreads(const Sampler& sampler) {
+  std::mutex mutex;
+  std::vector<double> snapShots;
+  std::vector<double> reports;
+  for (int round = 0; round < 10; ++round) {
+    std::latch start(kSessions);
+    std::vector<std::jthread> threads;
+    for (int session = 0; session < kSessions; ++session) {
+      threads.emplace_back([&] {
+        start.arrive_and_wait();
+        const auto first = Clock::now();
+        const SnapShot before = sampler.snapShot();
+        const auto second = Clock::now();
+        static_cast<void>(sampler.report(before));
+        const auto third = Clock::now();
+        const std::lock_guard lock(mutex);
+        snapShots.push_back(milliseconds(second - first));
+        reports.push_back(milliseconds(third - second));
+      });
+    }
+  }
+  tell("snapshot, 64 threads at once", snapShots);
+  tell("report, 64 threads at once", reports);
+}
+
+}  // namespace
+
+int main() {
+  std::string name = (std::filesystem::temp_directory_path() / "halvox-bench-XXXXXX").string();
+  if (mkdtemp(name.data()) == nullptr) return 1;
+  const std::filesystem::path directory(name);
+  writeFiles(directory, 1);
+  static ShownLog log;
+  ownDriversCategory() = &log;
+  {
+    CounterStatisticsService statistics;
+    std::vector<std::unique_ptr<DriverSource>> sources;
+    sources.push_back(std::make_unique<TextfileSource>(directory));
+    LinuxIOReportService service(std::move(sources), statistics);
+    service.open();
+    const Sampler sampler(service);
+    measureOne(sampler);
+    measureQueue(sampler, directory);
+    measureThreads(sampler);
+  }
+  std::filesystem::remove_all(directory);
+  return 0;
+}

@@ -1,0 +1,210 @@
+#include "tools/Drivers.h"
+
+#include <algorithm>
+#include <chrono>
+#include <iostream>
+#include <mutex>
+#include <variant>
+
+#include <poll.h>
+
+#include "platform/linux/drivers/ConfiguredSources.h"
+#include "platform/linux/drivers/DriverSourceLog.h"
+#include "platform/linux/drivers/LinuxIOReportService.h"
+#include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/runtime/CounterStatisticsService.h"
+#include "tools/JsonText.h"
+
+namespace halvox::tools {
+namespace {
+
+using platform::IOReportChannel;
+using platform::IOReportFormat;
+using platform::IOReportService;
+
+// What the sources complain of, as complaints of this program. Any thread.
+class ErrorLog final : public platform::LogCategory {
+ public:
+  ErrorLog() : LogCategory(platform::LogLevel::kError) {}
+  void write(platform::LogLevel /*level*/, std::string_view line) override {
+    constexpr std::size_t kPrefix = 32;  // the unit and its line
+    const std::lock_guard lock(mutex_);
+    std::cerr << "halvoxctl drivers: " << harmlessText(line.substr(std::min(kPrefix, line.size())))
+              << std::endl;
+  }
+
+ private:
+  std::mutex mutex_;
+};
+
+std::string numberText(double value) { return toJson(platform::Value(value)); }
+
+std::string count(std::uint64_t value, std::optional<double> seconds) {
+  return seconds ? numberText(static_cast<double>(value) / *seconds) : std::to_string(value);
+}
+
+std::string signedCount(std::int64_t value, std::optional<double> seconds) {
+  return seconds ? numberText(static_cast<double>(value) / *seconds) : std::to_string(value);
+}
+
+std::string textOf(const IOReportChannel& channel, std::optional<double> seconds) {
+  if (channel.format == IOReportFormat::kSimple) {
+    return " " + signedCount(channel.integerValue, seconds);
+  }
+  std::string text;
+  for (const auto& state : channel.states) {
+    if (state.inTransitions == 0 && state.residency == 0) continue;
+    text += " " + harmlessText(state.name) + "=" + count(state.residency, seconds) + "(" +
+            count(state.inTransitions, seconds) + "x)";
+  }
+  for (const auto& bucket : channel.buckets) {
+    if (bucket.hits == 0) continue;
+    text += " " + std::to_string(bucket.lower) + "-" + std::to_string(bucket.upper) + ":" +
+            count(bucket.hits, seconds);
+  }
+  return text.empty() ? " 0" : text;
+}
+
+std::string textLine(const IOReportChannel& channel, std::optional<double> seconds) {
+  std::string line;
+  for (const auto& name : {channel.driverName, channel.group, channel.subGroup}) {
+    line += (name ? harmlessText(*name) : "-") + "  ";
+  }
+  line += channel.channelName ? harmlessText(*channel.channelName) : "-";
+  line += " " + textOf(channel, seconds);
+  if (!channel.unitLabel.empty()) line += " " + harmlessText(channel.unitLabel);
+  return seconds ? line + "/s" : line;
+}
+
+std::string statesJson(const IOReportChannel& channel, std::optional<double> seconds) {
+  std::string json;
+  for (const auto& state : channel.states) {
+    json += (json.empty() ? "{\"name\":" : ",{\"name\":") + quoted(state.name) +
+            ",\"transitions\":" + count(state.inTransitions, seconds) +
+            ",\"residency\":" + count(state.residency, seconds) +
+            ",\"duty_cycle\":" + numberText(state.dutyCycle) + "}";
+  }
+  return "\"format\":\"state\",\"states\":[" + json + "]";
+}
+
+std::string bucketsJson(const IOReportChannel& channel, std::optional<double> seconds) {
+  std::string json;
+  for (const auto& bucket : channel.buckets) {
+    json += (json.empty() ? "{\"lower\":" : ",{\"lower\":") + std::to_string(bucket.lower) +
+            ",\"upper\":" + std::to_string(bucket.upper) +
+            ",\"hits\":" + count(bucket.hits, seconds) + "}";
+  }
+  return "\"format\":\"histogram\",\"buckets\":[" + json +
+         "],\"min\":" + std::to_string(channel.minValue) +
+         ",\"max\":" + std::to_string(channel.maxValue);
+}
+
+std::string jsonLine(const IOReportChannel& channel, std::optional<double> seconds) {
+  const auto name = [](const std::optional<std::string_view>& text) {
+    return text ? quoted(*text) : std::string("null");
+  };
+  std::string json =
+      "{\"driver\":" + name(channel.driverName) + ",\"group\":" + name(channel.group) +
+      ",\"subgroup\":" + name(channel.subGroup) + ",\"channel\":" + name(channel.channelName) +
+      ",\"unit\":" + quoted(channel.unitLabel) + ",";
+  if (seconds) json += "\"seconds\":" + numberText(*seconds) + ",";
+  if (channel.format == IOReportFormat::kState) {
+    json += statesJson(channel, seconds);
+  } else if (channel.format == IOReportFormat::kHistogram) {
+    json += bucketsJson(channel, seconds);
+  } else {
+    json += "\"format\":\"simple\",\"value\":" + signedCount(channel.integerValue, seconds);
+  }
+  return harmlessJson(json + "}");
+}
+
+// Samples the channels that the request chose.
+class DriverPrinter {
+ public:
+  DriverPrinter(IOReportService& service, const ShowDrivers& request, EventForm form,
+                std::ostream& out)
+      : service_(service), form_(form), out_(out) {
+    std::optional<platform::IOReportError> error;
+    IOReportService::Name group;
+    if (!request.group.empty()) group = request.group;
+    channels_ = service_.IOReportCopyChannelsInGroup(group, std::nullopt, error);
+    subscription_ = service_.IOReportCreateSubscription(channels_, channels_, error);
+  }
+
+  IOReportService::Samples sample() {
+    std::optional<platform::IOReportError> error;
+    return service_.IOReportCreateSamples(subscription_, channels_, error);
+  }
+
+  void print(const IOReportService::Samples& samples, std::optional<double> seconds) {
+    service_.IOReportIterate(samples, [&](const IOReportChannel& channel) {
+      out_ << formatChannel(channel, seconds, form_) << '\n';
+      return 0;
+    });
+    if (seconds && form_ == EventForm::kText) out_ << '\n';
+    out_.flush();
+  }
+
+  // Until nobody reads the output any more.
+  void watch(std::chrono::milliseconds interval, int outputDescriptor) {
+    using Clock = std::chrono::steady_clock;
+    auto before = sample();
+    auto time = Clock::now();
+    while (out_ && isReadFor(interval, outputDescriptor)) {
+      auto now = sample();
+      const auto nowTime = Clock::now();
+      std::optional<platform::IOReportError> error;
+      print(service_.IOReportCreateSamplesDelta(before, now, error),
+            std::chrono::duration<double>(nowTime - time).count());
+      before = std::move(now);
+      time = nowTime;
+    }
+  }
+
+ private:
+  static bool isReadFor(std::chrono::milliseconds time, int descriptor) {
+    pollfd output{descriptor, 0, 0};
+    const int polled = poll(&output, 1, static_cast<int>(time.count()));
+    return polled <= 0 || (output.revents & (POLLERR | POLLHUP | POLLNVAL)) == 0;
+  }
+
+  IOReportService& service_;
+  EventForm form_;
+  std::ostream& out_;
+  IOReportService::Channels channels_;
+  IOReportService::Subscription subscription_;
+};
+
+}  // namespace
+
+std::string formatChannel(const IOReportChannel& channel, std::optional<double> seconds,
+                          EventForm form) {
+  return form == EventForm::kJson ? jsonLine(channel, seconds) : textLine(channel, seconds);
+}
+
+ExitStatus showDrivers(const ShowDrivers& request, EventForm form, std::ostream& out,
+                       int outputDescriptor, std::ostream& errors) {
+  auto loaded = platform::linux_::loadConfiguration();
+  if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
+    errors << "halvoxctl drivers: " << harmlessText(error->description) << '\n';
+    return ExitStatus::kBadConfiguration;
+  }
+  // Lives as long as the process, because the sources' log remembers it.
+  static ErrorLog errorLog;
+  platform::linux_::ownDriversCategory() = &errorLog;
+  platform::linux_::CounterStatisticsService statistics;
+  platform::linux_::LinuxIOReportService service(
+      platform::linux_::makeDriverSources(
+          std::get<platform::linux_::Configuration>(loaded).drivers),
+      statistics);
+  service.open();
+  DriverPrinter printer(service, request, form, out);
+  if (request.watch) {
+    printer.watch(*request.watch, outputDescriptor);
+  } else {
+    printer.print(printer.sample(), std::nullopt);
+  }
+  return ExitStatus::kDone;
+}
+
+}  // namespace halvox::tools
