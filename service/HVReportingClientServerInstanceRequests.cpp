@@ -140,6 +140,7 @@ void HVReportingClientServerInstance::begin(const Session& session, const Delega
   session->setTlmReportingEnabled(mayUseLink(delegate));
   session->start();
   note(session, SessionChange::kStarted, delegate);
+  if (delegate != nullptr) session->setDriverSnapShot(delegate->getSnapShot());
   deliverHeldReply(*session);
   startReplies().heldBack.add();
   session->setTransactionCompleteBlock(reply);
@@ -163,6 +164,8 @@ void HVReportingClientServerInstance::carryOutStop(ReporterID reporterID, const 
 }
 
 void HVReportingClientServerInstance::end(const Session& session, const Delegate& delegate) {
+  if (delegate != nullptr) delegate->sendDriverLogsForSession(session);
+  session->setDriverSnapShot(std::nullopt);
   session->stop();
   note(session, SessionChange::kStopped, delegate);
   addToActiveSessionCount(delegate, -1);

@@ -359,14 +359,17 @@ TEST_F(HVReportingClientServerInstanceRequestsTest, AHeldReplyIsDeliveredByTheSt
 
 TEST_F(HVReportingClientServerInstanceRequestsTest, ATracingTestRepliesAtOnceAndAgainAtTheStop) {
   platform_.featureFlags.set("Acoustat", "Tracing", platform::FakeFeatureFlagService::State::kOn);
+  platform_.performanceTraces.completeAtStop("file:///trace");
   create(client_, 7);
   setServiceType(client_, AudioServiceType::kTest, 7);
   forgetSteps();
 
   const Call started = start(client_, 7);
   EXPECT_THAT(started->replies(), ElementsAre(ok(true)));
-  ASSERT_GE(steps().size(), 6U);
-  EXPECT_EQ(steps()[5], "startReportingSessionForID");  // before the list of active sessions
+  // After the features were read and before the list of active sessions.
+  ASSERT_GE(steps().size(), 10U);
+  EXPECT_EQ(steps()[8], "getting features");
+  EXPECT_EQ(steps()[9], "startReportingSessionForID");
 
   stop(client_, 7);
   EXPECT_THAT(started->replies(), ElementsAre(ok(true), ok(true)));

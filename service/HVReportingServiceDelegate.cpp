@@ -86,6 +86,7 @@ std::vector<std::shared_ptr<HVReportingSession>> sessionsOf(
 HVReportingServiceDelegate::HVReportingServiceDelegate()
     : defaults_((createReportingQueue(), HVReportingDefaults())), features_(makeFeatures()) {
   listenForFeatureStateChanges();
+  driverUtility_ = std::make_unique<HVReportingDriverUtility>();
   offerState();
   if (HVReportingUtilityIsInternalBuild()) {
     vekStateManager_ = std::make_unique<HVReportingUtilityVEKStateManager>();
@@ -123,6 +124,15 @@ void HVReportingServiceDelegate::registerClient(const Client& client) {
   index_.addClient(*client);
   client->setClientStartDate(platform::clock().currentDate());
   client->setClientProcessName(HVReportingUtilityProcessNameForPID(client->processIdentifier()));
+}
+
+DriverSnapShot HVReportingServiceDelegate::getSnapShot() const {
+  return driverUtility_->getSnapShot();
+}
+
+void HVReportingServiceDelegate::sendDriverLogsForSession(
+    const std::shared_ptr<HVReportingSession>& session) {
+  driverUtility_->sendDriverLogsForSession(session);
 }
 
 void HVReportingServiceDelegate::setReportingEnabled(bool enabled) {

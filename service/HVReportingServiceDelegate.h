@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "backends/HVReportingUtilityVEKStateManager.h"
+#include "driver/HVReportingDriverUtility.h"
 #include "platform/connection.h"
 #include "platform/notify.h"
 #include "platform/process.h"
@@ -64,6 +65,8 @@ class HVReportingServiceDelegate final
   void noteSessionChange(const HVReportingClientServerInstance& client,
                          const std::shared_ptr<HVReportingSession>& session,
                          SessionChange change) override;
+  [[nodiscard]] DriverSnapShot getSnapShot() const override;
+  void sendDriverLogsForSession(const std::shared_ptr<HVReportingSession>& session) override;
   void handleEventForVEK(const platform::Message& message, AudioEventCategory category,
                          AudioEventType type, const std::shared_ptr<HVReportingSession>& session,
                          std::string_view processName) override;
@@ -100,8 +103,9 @@ class HVReportingServiceDelegate final
   std::atomic<std::int64_t> activeSessionCount_{0};
   const platform::Dictionary defaults_;
   Features features_;  // never changes once made
-  std::unique_ptr<HVReportingUtilityVEKStateManager>
-      vekStateManager_;  // takes events on the reporting queue only
+  std::unique_ptr<const HVReportingDriverUtility> driverUtility_;
+  // Takes events on the reporting queue only.
+  std::unique_ptr<HVReportingUtilityVEKStateManager> vekStateManager_;
   // Ends with this object; those whom it gave handlers that refer to it look here first.
   const std::shared_ptr<const bool> alive_ = std::make_shared<bool>(true);
 };

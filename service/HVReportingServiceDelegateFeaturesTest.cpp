@@ -133,13 +133,18 @@ TEST_F(HVReportingServiceDelegateFeaturesTest, TheInitialiserReadsTheDefaultsThe
                           Read{"mobile", std::string(kOwn), "disable_reporting"}));
   EXPECT_THAT(platform_.notify.registeredNames(),
               ElementsAre(kAccessoryNotification, gReportingNotifydNotificationName));
-  EXPECT_THAT(lines(LogLevel::kInfo),
-              ElementsAre(testing::StartsWith("listening for features ({")));
+  EXPECT_THAT(lines(LogLevel::kInfo), ElementsAre(testing::StartsWith("listening for features ({"),
+                                                  "creating ioreporting driver utility"));
   EXPECT_EQ(lines(LogLevel::kInfo)[0].find("notify_token"), std::string::npos);
   EXPECT_THAT(lines(LogLevel::kDefault),
               ElementsAre("notify setup result 0 token 1", "notify setup result 0 token 2"));
-  EXPECT_EQ(steps().size(), 3U);
-  for (const auto& line : platform_.log.lines()) EXPECT_EQ(line.category, "hvrs");
+  // The drivers come last, after the registrations.
+  EXPECT_THAT(steps()[1], "notify setup result 0 token 1");
+  EXPECT_THAT(steps()[2], "notify setup result 0 token 2");
+  EXPECT_THAT(steps()[3], "creating ioreporting driver utility");
+  for (const auto& line : platform_.log.lines()) {
+    EXPECT_EQ(line.category, line.text == steps()[3] ? "hvrd" : "hvrs");
+  }
 }
 
 TEST_F(HVReportingServiceDelegateFeaturesTest, AFailedRegistrationIsLoggedAndHasToken0) {
@@ -249,7 +254,8 @@ TEST_F(HVReportingServiceDelegateFeaturesTest, AStartReadsTheStateBeforeATracing
 
   EXPECT_THAT(steps(),
               ElementsAre("starting session for reporter 7", "0x21044818",
-                          "starting session owned by 7", "0x2104482C", "getting features",
+                          "starting session owned by 7", "0x2104482C", "trace configuration",
+                          "trace session", "trace delegate", "trace start", "getting features",
                           "sending message for session owned by 7", "0x21044838",
                           "startReportingSessionForID", testing::StartsWith("sessions for client"),
                           testing::StartsWith("1 active reporting session(s)")));

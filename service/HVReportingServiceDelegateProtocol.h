@@ -7,6 +7,7 @@
 
 #include "backends/HVReportingVocabulary.h"
 #include "platform/value.h"
+#include "session/DriverSnapShot.h"
 
 namespace halvox {
 
@@ -48,6 +49,12 @@ class HVReportingServiceDelegateProtocol {
   [[nodiscard]] virtual std::int64_t activeSessionCount() const = 0;
   virtual void setActiveSessionCount(std::int64_t count) = 0;
 
+  // What the drivers have counted up to now. Waits for the sources of the counters, a moment at
+  // most for each.
+  [[nodiscard]] virtual DriverSnapShot getSnapShot() const = 0;
+  // Sends what the drivers counted since the session's snapshot, through it and to the analytics
+  // service. Waits as above.
+  virtual void sendDriverLogsForSession(const std::shared_ptr<HVReportingSession>& session) = 0;
   // Hands a message of a session, that a process of that name sent, to the bug capture; does
   // nothing on builds that are not internal.
   virtual void handleEventForVEK(const platform::Message& message, AudioEventCategory category,

@@ -1,0 +1,101 @@
+#include <string>
+#include <vector>
+
+#include "service/ServiceTest.h"
+
+// When sessions sample the drivers and tell what these counted.
+namespace halvox {
+namespace {
+
+using platform::JournalKind;
+using Texts = std::vector<std::string>;
+
+class HVReportingServiceDriversTest : public ServiceTest {
+ protected:
+  // A service that found channels at its start.
+  HVReportingServiceDriversTest() {
+    platform_.ioReport.setGroup(
+        "Speaker-(null)",
+        {{.driverName = "Amp", .group = "Speaker", .channelName = "cycles", .integerValue = 5}});
+    delegate_ = std::make_shared<HVReportingServiceDelegate>();
+    platform_.connections.serviceListener().setDelegate(*delegate_);
+    client_ = connect(100);
+    forgetSteps();
+  }
+  Texts operations() const { return platform_.journal.texts(JournalKind::kNote); }
+  // The steps that are named, in the order in which they happened.
+  Texts order(const std::vector<std::string_view>& named) const {
+    Texts found;
+    for (const std::string& step : steps()) {
+      if (std::ranges::find(named, step) != named.end()) found.push_back(step);
+    }
+    return found;
+  }
+
+  Connection client_;
+};
+
+TEST_F(HVReportingServiceDriversTest, StartTakesASnapshotAfterTheSessionHasStarted) {
+  createAndStart(client_, 7);
+
+  EXPECT_EQ(operations(), Texts{"samples Speaker-(null)"});
+  EXPECT_EQ(sessionOf(client_, 7)->driverSnapShot()->size(), 1U);
+  EXPECT_EQ(
+      order({"starting session owned by 7", "sampling driver Speaker-(null)", "getting features"}),
+      (Texts{"starting session owned by 7", "sampling driver Speaker-(null)", "getting features"}));
+}
+
+TEST_F(HVReportingServiceDriversTest, SecondStartDoesNotSampleAgain) {
+  createAndStart(client_, 7);
+  forgetSteps();
+
+  start(client_, 7);
+
+  EXPECT_TRUE(operations().empty());
+}
+
+TEST_F(HVReportingServiceDriversTest, StopTellsTheDifferenceBeforeTheSessionEnds) {
+  createAndStart(client_, 7);
+  forgetSteps();
+
+  stop(client_, 7);
+
+  EXPECT_EQ(operations(),
+            (Texts{"samples Speaker-(null)", "delta Speaker-(null)", "iterate Speaker-(null)"}));
+  EXPECT_EQ(sessionOf(client_, 7)->driverSnapShot(), std::nullopt);
+  const auto events = platform_.analytics.events("com.tarno.halvox.IOReporting.Simple");
+  ASSERT_EQ(events.size(), 1U);
+  EXPECT_EQ(events[0].payload->find("Amp_Speaker_Simple_cycles")->toInt64(), 5);
+  EXPECT_EQ(order({"done getting latest samples", "ending session 7"}),
+            (Texts{"done getting latest samples", "ending session 7", "ending session 7"}));
+}
+
+TEST_F(HVReportingServiceDriversTest, DestroyingAStartedSessionTellsNothing) {
+  createAndStart(client_, 7);
+  forgetSteps();
+
+  destroy(client_, 7);
+
+  EXPECT_TRUE(operations().empty());
+}
+
+TEST_F(HVReportingServiceDriversTest, EndOfTheConnectionTellsNothing) {
+  createAndStart(client_, 7);
+  forgetSteps();
+
+  clientOf(client_)->handleConnectionError();
+  run();
+
+  EXPECT_TRUE(operations().empty());
+}
+
+TEST_F(HVReportingServiceDriversTest, StoppingASessionThatIsNotStartedSamplesNothing) {
+  create(client_, 7);
+
+  stop(client_, 7);
+
+  EXPECT_TRUE(operations().empty());
+}
+
+}  // namespace
+}  // namespace halvox
