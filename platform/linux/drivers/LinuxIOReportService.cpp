@@ -100,7 +100,8 @@ IOReportService::Channels LinuxIOReportService::IOReportCopyChannelsInGroup(
     Name group, Name subGroup, std::optional<IOReportError>& /*error*/) {
   auto selection = std::make_shared<GroupSelection>(group, subGroup, readers_.size());
   std::size_t count = 0;
-  for (const auto& part : sample(readers_, *selection)->parts()) count += part.selection->size();
+  const auto samples = sample(readers_, *selection);
+  for (const auto& part : samples->parts()) count += part.selection->size();
   return std::make_shared<GroupChannels>(std::move(selection), static_cast<std::int32_t>(count));
 }
 

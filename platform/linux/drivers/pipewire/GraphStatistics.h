@@ -1,0 +1,67 @@
+#pragma once
+
+#include <array>
+#include <chrono>
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/linux/drivers/ReadingMaker.h"
+#include "platform/linux/drivers/pipewire/NodeStatistics.h"
+#include "platform/linux/pipewire/ProfileDecoder.h"
+
+namespace halvox::platform::linux_ {
+
+// What is counted of the sinks and sources of one PipeWire server after another, by what the server
+// tells. Nodes are known by the server's ids and forgotten when they go; an id that comes again is
+// another node. Knows no PipeWire and no clock: whoever tells gives the time. Not thread-safe.
+class GraphStatistics {
+ public:
+  using Time = NodeStatistics::Time;
+  using NodeID = std::uint32_t;
+
+  // More sinks and sources than that are left out: a client may make any number.
+  static constexpr std::size_t kMostNodes = 256;
+  static constexpr std::size_t kLongestName = 128;  // bytes; names are cut there
+
+  GraphStatistics();
+
+  void serverReached() { ++connections_; }
+  // All of its nodes are gone.
+  void serverLost();
+  // Measuring begins, after a time in which nothing was told of cycles.
+  void profilingBegan();
+
+  // False when the node is neither sink nor source, or one too many; nothing more need be told of
+  // it then. A second node of the same name is read as "name<id>".
+  bool nodeAdded(NodeID id, std::string_view mediaClass, std::string_view name);
+  void nodeRemoved(NodeID id) { nodes_.erase(id); }
+  void nodeStateChanged(NodeID id, std::optional<NodeState> state, Time now);
+  // A cycle that is told twice in a row, as PipeWire does when one was missed, counts once.
+  void cycleEnded(const pipewire::ProfiledCycle& cycle);
+
+  // All channels: the connections, then those of the nodes by their ids.
+  void addTo(ReadingMaker& maker, Time now) const;
+
+ private:
+  struct Driver {
+    std::chrono::nanoseconds lastCycle{};
+    std::uint32_t xruns = 0;
+  };
+
+  [[nodiscard]] NodeStatistics* find(NodeID id);
+  [[nodiscard]] std::string nameFor(NodeID id, std::string_view group, std::string_view name) const;
+  // How many there were since the driver's cycle before.
+  std::uint32_t newXruns(Driver& driver, const pipewire::ProfiledCycle& cycle) const;
+  [[nodiscard]] bool isRepeated(const pipewire::ProfiledCycle& cycle);
+
+  std::array<ChannelList::Channel, 2> connectionsChannels_;
+  std::uint64_t connections_ = 0;
+  std::map<NodeID, std::unique_ptr<NodeStatistics>> nodes_;
+  std::map<NodeID, Driver> drivers_;  // also those that are neither sink nor source
+};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,31 @@
+#pragma once
+
+#include <memory>
+#include <string>
+#include <utility>
+
+#include "platform/linux/drivers/DriverChannel.h"
+
+namespace halvox::platform::linux_ {
+
+// The groups under which sinks and sources are read, and the subgroup of both.
+inline constexpr const char* kSinkGroup = "Speaker";
+inline constexpr const char* kSourceGroup = "Rx";
+inline constexpr const char* kPipewireSubGroup = "PipeWire";
+
+// A simple channel of this source, to be made another one where that is meant.
+inline ChannelDescription describePipewireChannel(std::string group, std::string driver,
+                                                  std::string name) {
+  ChannelDescription channel;
+  channel.group = std::move(group);
+  channel.subGroup = kPipewireSubGroup;
+  channel.driverName = std::move(driver);
+  channel.channelName = std::move(name);
+  return channel;
+}
+
+inline ChannelList::Channel makeChannel(ChannelDescription description) {
+  return std::make_shared<const ChannelDescription>(std::move(description));
+}
+
+}  // namespace halvox::platform::linux_
