@@ -153,6 +153,7 @@ LinuxPlatform::LinuxPlatform(const Configuration& configuration)
       notify_(configuration_.notifyDirectory, preferenceReader_, statistics_),
       preferences_(preferenceReader_, statistics_),
       ioReport_(makeDriverSources(configuration_.drivers), statistics_),
+      resultsFiles_(configuration_.storage.root, statistics_),
       dispatch_(*log_, statistics_),
       nats_(configuration_.link.backend == LinkBackend::kNats
                 ? makeNatsTlmReporting(configuration_.link, {dispatch_, statistics_})

@@ -30,6 +30,8 @@
 #include "platform/linux/store/SqliteMetricService.h"
 #include "platform/linux/store/SqlitePowerLogService.h"
 #include "platform/linux/store/SqliteStore.h"
+#include "platform/linux/tracing/JsonResultsFileService.h"
+#include "platform/linux/tracing/PlistPropertyListService.h"
 #include "platform/services.h"
 
 namespace halvox::platform::linux_ {
@@ -94,8 +96,8 @@ class LinuxPlatform {
   LinuxIOReportService ioReport_;
   AbsentKtrace ktrace_;
   AbsentPerformanceTraces performanceTraces_;
-  AbsentPropertyLists propertyLists_;
-  AbsentResultsFiles resultsFiles_;
+  PlistPropertyListService propertyLists_;
+  JsonResultsFileService resultsFiles_;
   AsioDispatchService dispatch_;
   const std::unique_ptr<NatsTlmReporting> nats_;  // only when the link goes there
 };

@@ -1,0 +1,12 @@
+#include "platform/linux/tracing/TracingLog.h"
+
+#include "platform/services.h"
+
+namespace halvox::platform::linux_ {
+
+LogCategory& tracingCategory() {
+  static LogCategory& category = platform::log().createCategory("com.tarno.halvox", "tracing");
+  return category;
+}
+
+}  // namespace halvox::platform::linux_
