@@ -53,7 +53,8 @@ class KtraceService {
   virtual int ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) = 0;
   // Ends the recording and returns at once; the events and the completion follow.
   virtual void ktrace_end(const Session& session, int reason) = 0;
-  // What was recorded goes; the session is not used any more.
+  // What was recorded goes, and a session that still records ends without a completion: no handler
+  // is called any more once this has returned. The session is not used any more.
   virtual void ktrace_session_destroy(const Session& session) = 0;
   [[nodiscard]] virtual std::uint64_t ktrace_convert_timestamp_to_nanoseconds(
       const Session& session, std::uint64_t timestamp) const = 0;

@@ -152,6 +152,17 @@ TEST_F(TraceIntervalTest, ResultsAddUpOverPassesAndStartsDoNot) {
   EXPECT_EQ(interval.getNumTimesTraced(), 2U);
 }
 
+TEST_F(TraceIntervalTest, LinesGoToTheTracesCategoryUnderTheIntervalsName) {
+  anyThread({event(kEnd, 1)});
+  sameThread({event(kEnd, 1)});
+
+  for (const auto& line : platform_.log.lines()) {
+    EXPECT_EQ(line.category, "hvrt");
+    EXPECT_EQ(line.line.substr(0, 26), "            TraceInterval:");
+  }
+  EXPECT_EQ(platform_.log.lines().size(), 2U);
+}
+
 TEST_F(TraceIntervalTest, AverageIsTakenInSinglePrecision) {
   TraceInterval interval("IO", {kBegin, kEnd, false});
   interval.processTracepoints(

@@ -283,6 +283,14 @@ TEST_F(TraceParamsParserTest, PointOfAnotherKindIsOneWithoutKeysOfTheTypeBefore)
                    "TracePointType field not recognized or is empty."}));
 }
 
+TEST_F(TraceParamsParserTest, LinesGoToTheTracesCategoryUnderTheParsersName) {
+  (void)TraceParamsParser("/nowhere").loadTraceParams();
+
+  const auto line = platform_.log.lines().at(0);
+  EXPECT_EQ(line.category, "hvrt");
+  EXPECT_EQ(line.line.substr(0, 26), "        TraceParamsParser:");
+}
+
 // --- Paths --------------------------------------------------------------------------------------
 
 TEST_F(TraceParamsParserTest, RelativeNameStartsFromTheCurrentDirectory) {

@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <optional>
 #include <string>
+#include <utility>
 
 #include "platform/files.h"
 #include "platform/process.h"
@@ -34,7 +35,13 @@ TraceRunner::TraceRunner()
           kQueueLabel, platform::QualityOfService::kUtility, platform::QueueThreading::kOwnThread)),
       completion_(platform::dispatch().createSemaphore(0)) {}
 
-TraceRunner::~TraceRunner() = default;
+// A runner can go while it records, when its session is replaced by another without a stop. What
+// still records has handlers that lead here.
+TraceRunner::~TraceRunner() {
+  for (const auto& [trace, session] : sessions_) {
+    if (session != nullptr) platform::ktrace().ktrace_session_destroy(session);
+  }
+}
 
 std::uint32_t TraceRunner::getResultsVersion() { return kResultsVersion; }
 
@@ -72,7 +79,7 @@ void TraceRunner::setupTracing(Trace& trace) {
   platform::KtraceService& ktrace = platform::ktrace();
   const auto session = ktrace.ktrace_session_create();
   sessions_[&trace] = session;
-  // The runner waits for the completion of each trace before it goes.
+  // The runner goes after the completion, or destroys the session before it goes.
   ktrace.ktrace_set_completion_handler(session,
                                        [this, &trace] { tracingCompletionHandler(trace); });
   ktrace.ktrace_set_walltimes_enabled(session, true);
@@ -105,7 +112,7 @@ void TraceRunner::tracingCompletionHandler(Trace& trace) {
 }
 
 void TraceRunner::tearDownTracing(Trace& trace) {
-  platform::ktrace().ktrace_session_destroy(sessions_.at(&trace));
+  platform::ktrace().ktrace_session_destroy(std::exchange(sessions_.at(&trace), nullptr));
 }
 
 void TraceRunner::stopTracingandProcessResults() {

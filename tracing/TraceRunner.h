@@ -26,8 +26,9 @@ inline constexpr std::string_view HVReportingTracingLogsDirectory =
 //
 // The caller is one thread at a time. Events and completions come on the runner's own serial queue,
 // and the caller waits for them at the end, so what they write is read only after it is complete.
-// Owned by its session. Failures are logged and the rest goes on; only a results file that cannot
-// be opened ends the process, with exit status 1, and that is intended.
+// Owned by its session; when it goes unstopped, its recordings end and nothing is written. Failures
+// are logged and the rest goes on; only a results file that cannot be opened ends the process, with
+// exit status 1, and that is intended.
 class TraceRunner {
  public:
   TraceRunner();
@@ -61,7 +62,7 @@ class TraceRunner {
   std::atomic<std::uint32_t> completed_{0};  // read after the semaphore, which orders it
   std::shared_ptr<platform::DispatchQueue> queue_;
   std::shared_ptr<platform::DispatchSemaphore> completion_;
-  std::map<const Trace*, platform::KtraceService::Session> sessions_;
+  std::map<const Trace*, platform::KtraceService::Session> sessions_;  // null: torn down
   std::map<const Trace*, TraceData::Events> events_;
   Results results_;
 };

@@ -197,5 +197,63 @@ TEST_F(TraceRunnerTest, DirectoryIsMadeForEverybody) {
   EXPECT_EQ(directories.begin()->second, 0777U);
 }
 
+// --- Failures and early ends --------------------------------------------------------------------
+
+TEST_F(TraceRunnerTest, DirectoryThatCannotBeMadeIsLoggedAndTheFileIsTried) {
+  platform_.files.setDirectoryError(platform::Error{.description = "read-only"});
+
+  runAndStop();
+
+  EXPECT_EQ(errors(), Texts{"can't create logging directory at " +
+                            std::string(HVReportingTracingLogsDirectory) + ": read-only"});
+  EXPECT_TRUE(onlyFile().isClosed);
+}
+
+TEST_F(TraceRunnerTest, ResultsFileThatCannotBeOpenedEndsTheProcessWithStatusOne) {
+  add(params("Startup"));
+  platform_.resultsFiles.failToOpen();
+
+  EXPECT_THROW(runAndStop(), platform::FakeTermination);
+
+  EXPECT_EQ(platform_.process.terminations(), std::vector<int>{1});
+  EXPECT_EQ(platform_.log.texts(LogLevel::kInfo).back(), "Failed to open scoresheet writer");
+  EXPECT_TRUE(errors().empty());
+}
+
+TEST_F(TraceRunnerTest, RunnerThatGoesUnstoppedDestroysItsRecordings) {
+  auto runner = std::make_unique<TraceRunner>();
+  const TraceParams one = params("Startup");
+  runner->createTraceFromTraceParams(&one);
+  runner->createTraceFromTraceParams(&one);
+  runner->runTraces();
+  platform_.journal.clear();
+
+  runner.reset();
+
+  EXPECT_EQ(platform_.journal.texts(), (Texts{"ktrace destroy", "ktrace destroy"}));
+  EXPECT_TRUE(platform_.resultsFiles.files().empty());
+}
+
+TEST_F(TraceRunnerTest, RunnerThatWasStoppedDestroysNothingMore) {
+  auto runner = std::make_unique<TraceRunner>();
+  const TraceParams one = params("Startup");
+  runner->createTraceFromTraceParams(&one);
+  runner->runTraces();
+  runner->stopTracingandProcessResults();
+  platform_.journal.clear();
+
+  runner.reset();
+
+  EXPECT_TRUE(platform_.journal.texts().empty());
+}
+
+TEST_F(TraceRunnerTest, LinesGoToTheTracesCategoryUnderTheRunnersName) {
+  runner_.runTraces();
+
+  const auto line = platform_.log.lines().at(0);
+  EXPECT_EQ(line.category, "hvrt");
+  EXPECT_EQ(line.line.substr(0, 26), "              TraceRunner:");
+}
+
 }  // namespace
 }  // namespace halvox
