@@ -1,8 +1,7 @@
 #include "reporters/pipewire/ObjectBinding.h"
 
 #include <array>
-
-#include <pipewire/extensions/profiler.h>
+#include <utility>
 
 namespace halvox::pipewire_reporter {
 
@@ -69,20 +68,6 @@ void StreamBinding::onParam(void* data, int /*sequence*/, std::uint32_t param,
                             std::uint32_t /*index*/, std::uint32_t /*next*/, const spa_pod* value) {
   auto* self = static_cast<StreamBinding*>(data);
   self->listener_.onStreamParam(self->id_, param, value);
-}
-
-ProfilerBinding::ProfilerBinding(pw_registry* registry, std::uint32_t id, ProfileHandler profiled)
-    : profiled_(std::move(profiled)),
-      binding_(registry, id, PW_TYPE_INTERFACE_Profiler, PW_VERSION_PROFILER) {
-  static const pw_profiler_events kEvents = {.version = PW_VERSION_PROFILER_EVENTS,
-                                             .profile = &ProfilerBinding::onProfile};
-  if (binding_.isBound()) {
-    binding_.listen(&kEvents, this);
-  }
-}
-
-void ProfilerBinding::onProfile(void* data, const spa_pod* profile) {
-  static_cast<ProfilerBinding*>(data)->profiled_(profile);
 }
 
 }  // namespace halvox::pipewire_reporter

@@ -13,31 +13,23 @@
 #include <pipewire/impl-module.h>
 #include <pipewire/pipewire.h>
 
+#include "platform/linux/pipewire/Handles.h"
+#include "platform/linux/pipewire/ObjectBinding.h"
+#include "platform/linux/pipewire/ProfileDecoder.h"
 #include "reporters/pipewire/ObjectBinding.h"
 #include "reporters/pipewire/ParamDecoder.h"
-#include "reporters/pipewire/ProfileDecoder.h"
 
 namespace halvox::pipewire_reporter {
 namespace {
 
+using pipewire::ProfiledCycle;
+using pipewire::ProfilerBinding;
 using std::chrono::milliseconds;
 constexpr milliseconds kReconnectSoon{1};
 constexpr milliseconds kReconnectMin{100};
 constexpr milliseconds kReconnectMax{5000};
 constexpr std::string_view kClientIDProperty = "client.id";
 constexpr std::string_view kSerialProperty = "object.serial";
-
-struct ContextDeleter {
-  void operator()(pw_context* context) const { pw_context_destroy(context); }
-};
-struct CoreDeleter {
-  void operator()(pw_core* core) const { pw_core_disconnect(core); }
-};
-struct RegistryDeleter {
-  void operator()(pw_registry* registry) const {
-    pw_proxy_destroy(reinterpret_cast<pw_proxy*>(registry));
-  }
-};
 
 // The number under a key, or 0 when there is none that fits.
 GlobalID idProperty(const Properties& properties, std::string_view key) {
@@ -131,9 +123,9 @@ class PipeWireSource::Impl final : public StreamListener {
   milliseconds pause_ = kReconnectMin;
   bool connected_ = false;
   bool waitingTold_ = false;
-  std::unique_ptr<pw_context, ContextDeleter> context_;
-  std::unique_ptr<pw_core, CoreDeleter> core_;
-  std::unique_ptr<pw_registry, RegistryDeleter> registry_;
+  pipewire::UniqueContext context_;
+  pipewire::UniqueCore core_;
+  pipewire::UniqueRegistry registry_;
   spa_hook coreHook_{};
   spa_hook registryHook_{};
   std::unordered_map<GlobalID, Stream> streams_;
@@ -237,7 +229,7 @@ void PipeWireSource::Impl::updateProfiler() {
 }
 
 void PipeWireSource::Impl::onProfile(const spa_pod* profile) {
-  for (const ProfiledCycle& cycle : decodeProfile(profile)) {
+  for (const ProfiledCycle& cycle : pipewire::decodeProfile(profile)) {
     tracker_.cycleEnded(cycle.time, cycle.length, cycle.late);
   }
 }

@@ -1,4 +1,4 @@
-#include "reporters/pipewire/ProfileDecoder.h"
+#include "platform/linux/pipewire/ProfileDecoder.h"
 
 #include <optional>
 #include <utility>
@@ -7,13 +7,14 @@
 #include <spa/pod/iter.h>
 #include <spa/pod/parser.h>
 
-namespace halvox::pipewire_reporter {
+namespace halvox::pipewire {
 namespace {
 
 // The stages of a node's work in a cycle, as the profiler tells them. A node that was not even
 // called waits for another one, and that one is late.
 constexpr std::int32_t kCalled = 1;
 constexpr std::int32_t kAwake = 2;
+constexpr std::int32_t kFinished = 3;
 
 // No device works in longer cycles; what claims to is no clock of audio.
 constexpr std::chrono::duration<double> kLongestCycle{10};
@@ -39,23 +40,54 @@ bool readClock(const spa_pod& value, ProfiledCycle& cycle) {
   return cycle.length.count() > 0 && cycle.length <= kLongestCycle;
 }
 
-// The node's ID when it is late.
-std::optional<std::uint32_t> readLateNode(const spa_pod& value) {
+struct ReadNode {
+  ProfiledNode node;
+  std::int32_t stage = 0;
+};
+
+std::optional<ReadNode> readNode(const spa_pod& value) {
   std::int32_t id = 0;
   const char* name = nullptr;
   std::int64_t previousSignal = 0;
   std::int64_t signal = 0;
   std::int64_t awake = 0;
   std::int64_t finish = 0;
-  std::int32_t status = 0;
+  std::int32_t stage = 0;
   if (spa_pod_parse_struct(&value,                                   //
                            SPA_POD_Int(&id), SPA_POD_String(&name),  //
                            SPA_POD_Long(&previousSignal), SPA_POD_Long(&signal),
-                           SPA_POD_Long(&awake), SPA_POD_Long(&finish), SPA_POD_Int(&status)) < 0 ||
-      (status != kCalled && status != kAwake)) {
+                           SPA_POD_Long(&awake), SPA_POD_Long(&finish), SPA_POD_Int(&stage)) < 0) {
     return std::nullopt;
   }
-  return static_cast<std::uint32_t>(id);
+  ReadNode read{.node = {.id = static_cast<std::uint32_t>(id)}, .stage = stage};
+  // A stage that was not reached has the time of an earlier cycle, or none, which is 0. That times
+  // are positive also keeps the differences from overflowing.
+  if (signal > 0 && awake >= signal && stage >= kAwake) {
+    read.node.wait = std::chrono::nanoseconds(awake - signal);
+    if (finish >= awake && stage >= kFinished) {
+      read.node.busy = std::chrono::nanoseconds(finish - awake);
+    }
+  }
+  return read;
+}
+
+void addFollower(const ReadNode& read, ProfiledCycle& cycle) {
+  if (read.stage < kCalled || read.stage > kFinished) return;
+  cycle.followers.push_back(read.node);
+  if (read.stage < kFinished) cycle.late.push_back(read.node.id);
+}
+
+// Of the figures that stand for the load, only the count of xruns, the last one.
+std::uint32_t readXruns(const spa_pod& value) {
+  std::int64_t counter = 0;
+  float fast = 0;
+  float medium = 0;
+  float slow = 0;
+  std::int32_t xruns = 0;
+  const bool isRead =
+      spa_pod_parse_struct(&value, SPA_POD_Long(&counter), SPA_POD_Float(&fast),
+                           SPA_POD_Float(&medium), SPA_POD_Float(&slow), SPA_POD_Int(&xruns)) >= 0;
+  return isRead ? static_cast<std::uint32_t>(xruns) : 0;
 }
 
 std::optional<ProfiledCycle> readCycle(const spa_pod* pod) {
@@ -64,10 +96,14 @@ std::optional<ProfiledCycle> readCycle(const spa_pod* pod) {
   bool hasClock = false;
   spa_pod_prop* prop = nullptr;
   SPA_POD_OBJECT_FOREACH(object, prop) {
-    if (prop->key == SPA_PROFILER_clock) {
+    if (prop->key == SPA_PROFILER_info) {
+      cycle.driverXruns = readXruns(prop->value);
+    } else if (prop->key == SPA_PROFILER_clock) {
       hasClock = readClock(prop->value, cycle);
+    } else if (prop->key == SPA_PROFILER_driverBlock) {
+      if (const auto read = readNode(prop->value)) cycle.driver = read->node;
     } else if (prop->key == SPA_PROFILER_followerBlock) {
-      if (const auto id = readLateNode(prop->value)) cycle.late.push_back(*id);
+      if (const auto read = readNode(prop->value)) addFollower(*read, cycle);
     }
   }
   return hasClock ? std::optional(std::move(cycle)) : std::nullopt;
@@ -88,4 +124,4 @@ std::vector<ProfiledCycle> decodeProfile(const spa_pod* profile) {
   return cycles;
 }
 
-}  // namespace halvox::pipewire_reporter
+}  // namespace halvox::pipewire

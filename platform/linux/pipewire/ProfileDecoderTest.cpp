@@ -1,4 +1,4 @@
-#include "reporters/pipewire/ProfileDecoder.h"
+#include "platform/linux/pipewire/ProfileDecoder.h"
 
 #include <array>
 #include <vector>
@@ -8,7 +8,7 @@
 #include <spa/pod/builder.h>
 #include <spa/pod/parser.h>
 
-namespace halvox::pipewire_reporter {
+namespace halvox::pipewire {
 namespace {
 
 using std::chrono::nanoseconds;
@@ -19,12 +19,14 @@ class ProfileDecoderTest : public testing::Test {
   struct Follower {
     int id;
     int status;
+    std::int64_t awake = 50;
   };
   struct Cycle {
     std::int64_t time = 0;
     std::int64_t duration = 1024;
     spa_fraction rate{1, 48000};
     std::vector<Follower> followers = {};
+    int xruns = 2;
   };
 
   ProfileDecoderTest() { spa_pod_builder_init(&builder_, buffer_.data(), sizeof buffer_); }
@@ -40,7 +42,7 @@ class ProfileDecoderTest : public testing::Test {
     spa_pod_builder_push_object(&builder_, &frame, SPA_TYPE_OBJECT_Profiler, 0);
     spa_pod_builder_prop(&builder_, SPA_PROFILER_info, 0);
     spa_pod_builder_add_struct(&builder_, SPA_POD_Long(1), SPA_POD_Float(0.1F), SPA_POD_Float(0.1F),
-                               SPA_POD_Float(0.1F), SPA_POD_Int(2));
+                               SPA_POD_Float(0.1F), SPA_POD_Int(cycle.xruns));
     spa_pod_builder_prop(&builder_, SPA_PROFILER_clock, 0);
     spa_pod_builder_add_struct(&builder_, SPA_POD_Int(0), SPA_POD_Int(30), SPA_POD_String("clock"),
                                SPA_POD_Long(cycle.time), SPA_POD_Fraction(&cycle.rate),
@@ -56,7 +58,8 @@ class ProfileDecoderTest : public testing::Test {
     const spa_fraction latency{1024, 48000};
     spa_pod_builder_prop(&builder_, key, 0);
     spa_pod_builder_add_struct(&builder_, SPA_POD_Int(node.id), SPA_POD_String("node"),
-                               SPA_POD_Long(1), SPA_POD_Long(2), SPA_POD_Long(3), SPA_POD_Long(4),
+                               SPA_POD_Long(10), SPA_POD_Long(20), SPA_POD_Long(node.awake),
+                               SPA_POD_Long(120),  //
                                SPA_POD_Int(node.status), SPA_POD_Fraction(&latency));
   }
 
@@ -82,6 +85,41 @@ TEST_F(ProfileDecoderTest, NodesThatWereCalledAndDidNotFinishAreLate) {
 
   ASSERT_EQ(cycles.size(), 1U);
   EXPECT_EQ(cycles[0].late, (std::vector<std::uint32_t>{41, 42}));
+}
+
+TEST_F(ProfileDecoderTest, ANodeHasTheTimesOfTheStagesThatItReached) {
+  const auto cycles = decodeProfile(makeProfile({{.followers = {{40, 3}, {41, 2}, {42, 1}}}}));
+
+  ASSERT_EQ(cycles.size(), 1U);
+  const ProfiledNode driver{.id = 30, .wait = nanoseconds(30), .busy = nanoseconds(70)};
+  const ProfiledNode finished{.id = 40, .wait = nanoseconds(30), .busy = nanoseconds(70)};
+  const ProfiledNode awake{.id = 41, .wait = nanoseconds(30)};
+  const ProfiledNode called{.id = 42};
+  EXPECT_EQ(cycles[0].driver, driver);
+  EXPECT_EQ(cycles[0].followers, (std::vector<ProfiledNode>{finished, awake, called}));
+}
+
+TEST_F(ProfileDecoderTest, ANodeThatWasNeverWokenHasNoTimes) {
+  const auto cycles = decodeProfile(makeProfile({{.followers = {{40, 3, 0}}}}));
+
+  ASSERT_EQ(cycles.size(), 1U);
+  EXPECT_EQ(cycles[0].followers, std::vector<ProfiledNode>{{.id = 40}});
+}
+
+TEST_F(ProfileDecoderTest, FollowersWhoseTurnItWasNotAreLeftOut) {
+  const auto cycles = decodeProfile(makeProfile({{.followers = {{40, 0}, {41, 4}, {42, -1}}}}));
+
+  ASSERT_EQ(cycles.size(), 1U);
+  EXPECT_TRUE(cycles[0].followers.empty());
+  EXPECT_TRUE(cycles[0].late.empty());
+}
+
+TEST_F(ProfileDecoderTest, ACycleHasTheCountOfXrunsOfItsDriver) {
+  const auto cycles = decodeProfile(makeProfile({{.xruns = 7}, {.xruns = 8}}));
+
+  ASSERT_EQ(cycles.size(), 2U);
+  EXPECT_EQ(cycles[0].driverXruns, 7U);
+  EXPECT_EQ(cycles[1].driverXruns, 8U);
 }
 
 TEST_F(ProfileDecoderTest, CyclesOfAnImplausibleLengthAreLeftOut) {
@@ -118,4 +156,4 @@ TEST_F(ProfileDecoderTest, BlocksOfOtherShapesAreLeftOut) {
 }
 
 }  // namespace
-}  // namespace halvox::pipewire_reporter
+}  // namespace halvox::pipewire

@@ -1,0 +1,37 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <optional>
+#include <vector>
+
+struct spa_pod;
+
+namespace halvox::pipewire {
+
+// What a node did in one cycle. A time that was not measured in this cycle is absent.
+struct ProfiledNode {
+  std::uint32_t id = 0;
+  std::optional<std::chrono::nanoseconds> wait{};  // from its call to the start of its work
+  std::optional<std::chrono::nanoseconds> busy{};  // from there to the end of its work
+  friend bool operator==(const ProfiledNode&, const ProfiledNode&) = default;
+};
+
+// What PipeWire's profiler tells of one cycle of a driver, as far as it is of interest.
+struct ProfiledCycle {
+  std::chrono::nanoseconds time{};         // of the driver's clock
+  std::chrono::duration<double> length{};  // what each node had to produce or take
+  std::uint32_t driverXruns = 0;           // so far, since the driver started
+  std::optional<ProfiledNode> driver{};
+  // The nodes that follow the driver and whose turn it was.
+  std::vector<ProfiledNode> followers{};
+  // Those of them that had not finished when the cycle ended.
+  std::vector<std::uint32_t> late{};
+  friend bool operator==(const ProfiledCycle&, const ProfiledCycle&) = default;
+};
+
+// The cycles of one event of the profiler, in order; those that cannot be read, or whose clock has
+// no plausible length, are left out.
+std::vector<ProfiledCycle> decodeProfile(const spa_pod* profile);
+
+}  // namespace halvox::pipewire
