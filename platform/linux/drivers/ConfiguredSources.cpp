@@ -2,6 +2,9 @@
 
 #include "platform/linux/drivers/alsa/AlsaSource.h"
 #include "platform/linux/drivers/textfile/TextfileSource.h"
+#ifdef HALVOX_WITH_PIPEWIRE
+#include "platform/linux/drivers/pipewire/PipewireSource.h"
+#endif
 
 namespace halvox::platform::linux_ {
 
@@ -9,6 +12,9 @@ std::vector<std::unique_ptr<DriverSource>> makeDriverSources(
     const Configuration::Drivers& drivers) {
   std::vector<std::unique_ptr<DriverSource>> sources;
   if (drivers.alsa) sources.push_back(std::make_unique<AlsaSource>(drivers.alsaRoot));
+#ifdef HALVOX_WITH_PIPEWIRE
+  if (drivers.pipewire) sources.push_back(std::make_unique<PipewireSource>());
+#endif
   sources.push_back(std::make_unique<TextfileSource>(drivers.textfiles));
   return sources;
 }

@@ -30,7 +30,7 @@ void ReadingMaker::add(Channel channel, std::span<const std::uint64_t> values) {
   values_.insert(values_.end(), values.begin(), values.end());
 }
 
-std::shared_ptr<const Reading> ReadingMaker::finish() {
+std::shared_ptr<const Reading> ReadingMaker::finish(std::shared_ptr<void> lease) {
   if (list_ == nullptr || !isListOf(*list_, channels_)) {
     list_ = std::make_shared<const ChannelList>(channels_);
   }
@@ -40,6 +40,7 @@ std::shared_ptr<const Reading> ReadingMaker::finish() {
   reading->channels = list_;
   reading->values = values_;
   values_.clear();
+  reading->lease = std::move(lease);
   return reading;
 }
 

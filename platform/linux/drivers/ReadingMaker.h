@@ -23,8 +23,8 @@ class ReadingMaker {
            std::span<const std::uint64_t> values);
   // Adds a channel whose identity the source keeps itself.
   void add(Channel channel, std::span<const std::uint64_t> values);
-  // The reading of all that was added since the last one. Never null.
-  [[nodiscard]] std::shared_ptr<const Reading> finish();
+  // The reading of all that was added since the last one; it holds the lease. Never null.
+  [[nodiscard]] std::shared_ptr<const Reading> finish(std::shared_ptr<void> lease = nullptr);
 
  private:
   std::map<std::string, Channel> known_;

@@ -38,7 +38,7 @@ class GraphStatistics {
   // False when the node is neither sink nor source, or one too many; nothing more need be told of
   // it then. A second node of the same name is read as "name<id>".
   bool nodeAdded(NodeID id, std::string_view mediaClass, std::string_view name);
-  void nodeRemoved(NodeID id) { nodes_.erase(id); }
+  void nodeRemoved(NodeID id);
   void nodeStateChanged(NodeID id, std::optional<NodeState> state, Time now);
   // A cycle that is told twice in a row, as PipeWire does when one was missed, counts once.
   void cycleEnded(const pipewire::ProfiledCycle& cycle);
@@ -54,10 +54,6 @@ class GraphStatistics {
 
   [[nodiscard]] NodeStatistics* find(NodeID id);
   [[nodiscard]] std::string nameFor(NodeID id, std::string_view group, std::string_view name) const;
-  // How many there were since the driver's cycle before.
-  std::uint32_t newXruns(Driver& driver, const pipewire::ProfiledCycle& cycle) const;
-  [[nodiscard]] bool isRepeated(const pipewire::ProfiledCycle& cycle);
-
   std::array<ChannelList::Channel, 2> connectionsChannels_;
   std::uint64_t connections_ = 0;
   std::map<NodeID, std::unique_ptr<NodeStatistics>> nodes_;

@@ -52,7 +52,8 @@ std::vector<BucketBounds> DurationHistogram::bounds() {
 }
 
 void DurationHistogram::add(std::chrono::nanoseconds duration) {
-  const std::int64_t value = std::max<std::int64_t>(0, duration_cast<microseconds>(duration).count());
+  const std::int64_t value =
+      std::max<std::int64_t>(0, duration_cast<microseconds>(duration).count());
   const auto* const next = std::ranges::upper_bound(kLowerBounds, value);
   ++hits_[static_cast<std::size_t>(next - kLowerBounds.begin()) - 1];
   minimum_ = std::min(minimum_.value_or(value), value);

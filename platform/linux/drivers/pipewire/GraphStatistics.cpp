@@ -1,0 +1,107 @@
+#include "platform/linux/drivers/pipewire/GraphStatistics.h"
+
+#include <algorithm>
+#include <span>
+
+#include "platform/linux/drivers/pipewire/PipewireChannel.h"
+#include "platform/linux/runtime/Utf8.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// The group of a node's class; empty when it is neither sink nor source. What is both at once
+// counts as a sink.
+std::string_view groupOf(std::string_view mediaClass) {
+  if (mediaClass == "Audio/Sink" || mediaClass == "Audio/Duplex") return kSinkGroup;
+  if (mediaClass == "Audio/Source" || mediaClass == "Audio/Source/Virtual") return kSourceGroup;
+  return {};
+}
+
+// At most kLongestName bytes of it, and no part of a character.
+std::string cleanName(std::string_view name) {
+  std::size_t length = 0;
+  while (length < name.size()) {
+    const std::size_t next = length + nextUtf8(name.substr(length)).length;
+    if (next > GraphStatistics::kLongestName) break;
+    length = next;
+  }
+  return replaceInvalidUtf8(name.substr(0, length));
+}
+
+}  // namespace
+
+GraphStatistics::GraphStatistics()
+    : connectionsChannels_{
+          makeChannel(describePipewireChannel(kSinkGroup, "pipewire", "connections")),
+          makeChannel(describePipewireChannel(kSourceGroup, "pipewire", "connections"))} {}
+
+void GraphStatistics::serverLost() {
+  nodes_.clear();
+  drivers_.clear();
+}
+
+void GraphStatistics::profilingBegan() {
+  drivers_.clear();
+  for (auto& [id, node] : nodes_) node->restartExtremes();
+}
+
+bool GraphStatistics::nodeAdded(NodeID id, std::string_view mediaClass, std::string_view name) {
+  const std::string_view group = groupOf(mediaClass);
+  if (group.empty() || nodes_.size() >= kMostNodes) return false;
+  nodes_[id] = std::make_unique<NodeStatistics>(std::string(group), nameFor(id, group, name));
+  return true;
+}
+
+void GraphStatistics::nodeRemoved(NodeID id) {
+  nodes_.erase(id);
+  drivers_.erase(id);
+}
+
+void GraphStatistics::nodeStateChanged(NodeID id, std::optional<NodeState> state, Time now) {
+  if (auto* node = find(id)) node->stateChanged(state, now);
+}
+
+void GraphStatistics::cycleEnded(const pipewire::ProfiledCycle& cycle) {
+  if (!cycle.driver.has_value()) return;
+  const auto [found, isFirst] = drivers_.try_emplace(cycle.driver->id);
+  Driver& driver = found->second;
+  const bool isRepeated = !isFirst && driver.lastCycle == cycle.time;
+  // A driver that starts anew may count anew.
+  const bool hasXruns = !isFirst && cycle.driverXruns > driver.xruns;
+  const std::uint32_t xruns = hasXruns ? cycle.driverXruns - driver.xruns : 0;
+  driver = {.lastCycle = cycle.time, .xruns = cycle.driverXruns};
+  if (auto* node = find(cycle.driver->id)) {
+    if (!isRepeated) node->cycleEnded(*cycle.driver);
+    node->xrunsHappened(xruns);
+  }
+  if (isRepeated) return;
+  for (const pipewire::ProfiledNode& follower : cycle.followers) {
+    if (auto* node = find(follower.id)) node->cycleEnded(follower);
+  }
+  for (const NodeID late : cycle.late) {
+    if (auto* node = find(late)) node->xrunsHappened(1);
+  }
+}
+
+void GraphStatistics::addTo(ReadingMaker& maker, Time now) const {
+  for (const auto& channel : connectionsChannels_) {
+    maker.add(channel, std::span(&connections_, 1));
+  }
+  for (const auto& [id, node] : nodes_) node->addTo(maker, now);
+}
+
+NodeStatistics* GraphStatistics::find(NodeID id) {
+  const auto found = nodes_.find(id);
+  return found == nodes_.end() ? nullptr : found->second.get();
+}
+
+std::string GraphStatistics::nameFor(NodeID id, std::string_view group,
+                                     std::string_view name) const {
+  std::string clean = cleanName(name);
+  const bool isTaken = std::ranges::any_of(nodes_, [&](const auto& entry) {
+    return entry.second->group() == group && entry.second->driverName() == clean;
+  });
+  return isTaken ? clean + "<" + std::to_string(id) + ">" : clean;
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,207 @@
+#include "platform/linux/drivers/pipewire/GraphStatistics.h"
+
+#include <algorithm>
+#include <string>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "platform/linux/drivers/DriverTesting.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using namespace std::chrono_literals;
+using pipewire::ProfiledCycle;
+using pipewire::ProfiledNode;
+using ::testing::Contains;
+using testing::describe;
+using ::testing::ElementsAre;
+using ::testing::EndsWith;
+using ::testing::IsEmpty;
+using ::testing::StartsWith;
+
+class GraphStatisticsTest : public ::testing::Test {
+ protected:
+  // The channels as lines, those only that begin so.
+  std::vector<std::string> read(std::string_view start = "") {
+    graph.addTo(maker, now);
+    std::vector<std::string> lines = describe(testing::samplesOf(maker.finish()));
+    std::erase_if(lines, [start](const std::string& line) { return !line.starts_with(start); });
+    return lines;
+  }
+  // A cycle of driver 30 with its follower 40.
+  ProfiledCycle cycle(std::chrono::nanoseconds time) const {
+    return {.time = time,
+            .length = 10ms,
+            .driverXruns = 5,
+            .driver = ProfiledNode{.id = 30, .wait = 60us, .busy = 300us},
+            .followers = {{.id = 40, .wait = 10us, .busy = 20us}}};
+  }
+
+  GraphStatistics graph;
+  ReadingMaker maker;
+  GraphStatistics::Time now{1000h};
+};
+
+TEST_F(GraphStatisticsTest, OnlyTheConnectionsAreThereWithoutAServer) {
+  EXPECT_THAT(read(), ElementsAre("pipewire/Speaker/PipeWire/connections  = 0",
+                                  "pipewire/Rx/PipeWire/connections  = 0"));
+
+  graph.serverReached();
+  graph.serverLost();
+  graph.serverReached();
+
+  EXPECT_THAT(read(), ElementsAre("pipewire/Speaker/PipeWire/connections  = 2",
+                                  "pipewire/Rx/PipeWire/connections  = 2"));
+}
+
+TEST_F(GraphStatisticsTest, SinksAndSourcesHaveChannelsAndOtherNodesHaveNone) {
+  EXPECT_TRUE(graph.nodeAdded(30, "Audio/Sink", "speakers"));
+  EXPECT_TRUE(graph.nodeAdded(31, "Audio/Source", "microphone"));
+  EXPECT_FALSE(graph.nodeAdded(32, "Stream/Output/Audio", "player"));
+  EXPECT_FALSE(graph.nodeAdded(33, "Video/Source", "camera"));
+
+  EXPECT_THAT(read("speakers"), ElementsAre("speakers/Speaker/PipeWire/cycles  = 0",
+                                            "speakers/Speaker/PipeWire/xruns  = 0",
+                                            StartsWith("speakers/Speaker/PipeWire/busy time us ="),
+                                            StartsWith("speakers/Speaker/PipeWire/wait time us ="),
+                                            "speakers/Speaker/PipeWire/state us ="));
+  EXPECT_THAT(read("microphone"), Contains("microphone/Rx/PipeWire/cycles  = 0"));
+  EXPECT_EQ(read().size(), 12U);
+}
+
+TEST_F(GraphStatisticsTest, ACycleCountsForItsDriverAndForEachFollower) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.nodeAdded(40, "Audio/Source", "microphone");
+
+  graph.cycleEnded(cycle(1s));
+  graph.cycleEnded(cycle(2s));
+
+  EXPECT_THAT(read("speakers"), Contains(EndsWith("/cycles  = 2")));
+  EXPECT_THAT(read("speakers/Speaker/PipeWire/busy"),
+              ElementsAre(::testing::HasSubstr(" 200-500:2 ")));
+  EXPECT_THAT(read("speakers/Speaker/PipeWire/busy"), ElementsAre(EndsWith("min 300 max 300")));
+  EXPECT_THAT(read("speakers/Speaker/PipeWire/wait"), ElementsAre(EndsWith("min 60 max 60")));
+  EXPECT_THAT(read("microphone"), Contains(EndsWith("/cycles  = 2")));
+  EXPECT_THAT(read("microphone/Rx/PipeWire/wait"), ElementsAre(EndsWith("min 10 max 10")));
+}
+
+TEST_F(GraphStatisticsTest, ACycleThatIsToldTwiceCountsOnceWithItsXruns) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.nodeAdded(40, "Audio/Sink", "more");
+  ProfiledCycle missed = cycle(2s);
+  missed.late = {40};
+
+  graph.cycleEnded(cycle(1s));
+  graph.cycleEnded(missed);
+  missed.driverXruns = 6;
+  graph.cycleEnded(missed);
+
+  EXPECT_THAT(read("speakers"), Contains(EndsWith("/cycles  = 2")));
+  EXPECT_THAT(read("speakers"), Contains(EndsWith("/xruns  = 1")));
+  EXPECT_THAT(read("more"), Contains(EndsWith("/cycles  = 2")));
+  EXPECT_THAT(read("more"), Contains(EndsWith("/xruns  = 1")));
+}
+
+TEST_F(GraphStatisticsTest, XrunsFromBeforeTheMeasurementDoNotCount) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.cycleEnded(cycle(1s));
+  ProfiledCycle later = cycle(9s);
+  later.driverXruns = 50;
+
+  graph.profilingBegan();
+  graph.cycleEnded(later);
+
+  EXPECT_THAT(read("speakers"), Contains(EndsWith("/xruns  = 0")));
+  EXPECT_THAT(read("speakers"), Contains(EndsWith("/cycles  = 2")));
+}
+
+TEST_F(GraphStatisticsTest, ACountOfXrunsThatWentBackCountsNone) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.cycleEnded(cycle(1s));
+  ProfiledCycle restarted = cycle(2s);
+  restarted.driverXruns = 1;
+
+  graph.cycleEnded(restarted);
+
+  EXPECT_THAT(read("speakers"), Contains(EndsWith("/xruns  = 0")));
+}
+
+TEST_F(GraphStatisticsTest, CyclesOfNodesThatAreNeitherSinkNorSourceAreLeftOut) {
+  graph.nodeAdded(40, "Audio/Sink", "speakers");
+
+  graph.cycleEnded(cycle(1s));
+  graph.cycleEnded({.time = 2s, .length = 10ms, .followers = {{.id = 40}}});
+
+  EXPECT_THAT(read("speakers"), Contains(EndsWith("/cycles  = 1")));
+}
+
+TEST_F(GraphStatisticsTest, StatesGatherTimeUntilTheReading) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.nodeStateChanged(30, NodeState::kIdle, now);
+  graph.nodeStateChanged(30, NodeState::kRunning, now + 1s);
+  now += 4s;
+
+  EXPECT_THAT(read("speakers/Speaker/PipeWire/state"),
+              ElementsAre("speakers/Speaker/PipeWire/state us = running:1:3000000 idle:0:1000000"));
+}
+
+TEST_F(GraphStatisticsTest, TheSecondNodeOfANameHasItsNumberBehindIt) {
+  graph.nodeAdded(30, "Audio/Sink", "twin");
+  graph.nodeAdded(31, "Audio/Sink", "twin");
+  graph.nodeAdded(32, "Audio/Source", "twin");
+
+  EXPECT_THAT(read("twin/Speaker"), Contains("twin/Speaker/PipeWire/cycles  = 0"));
+  EXPECT_THAT(read("twin<31>"), Contains("twin<31>/Speaker/PipeWire/cycles  = 0"));
+  EXPECT_THAT(read("twin/Rx"), Contains("twin/Rx/PipeWire/cycles  = 0"));
+}
+
+TEST_F(GraphStatisticsTest, ANodeThatGoesTakesItsChannelsAndItsSuccessorCountsFromZero) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.cycleEnded(cycle(1s));
+  graph.nodeRemoved(30);
+  EXPECT_THAT(read("speakers"), IsEmpty());
+
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+
+  EXPECT_THAT(read("speakers"), Contains(EndsWith("/cycles  = 0")));
+}
+
+TEST_F(GraphStatisticsTest, AllNodesGoWithTheServer) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+
+  graph.serverLost();
+
+  EXPECT_THAT(read("speakers"), IsEmpty());
+}
+
+TEST_F(GraphStatisticsTest, ReadingsShareTheirChannelsAsLongAsTheNodesStay) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.addTo(maker, now);
+  const auto first = maker.finish();
+  graph.cycleEnded(cycle(1s));
+  graph.addTo(maker, now);
+
+  EXPECT_EQ(maker.finish()->channels, first->channels);
+}
+
+TEST_F(GraphStatisticsTest, NamesAreCutAndCleaned) {
+  graph.nodeAdded(30, "Audio/Sink", std::string(127, 'n') + "\xc3\xa9");
+  graph.nodeAdded(31, "Audio/Sink", "\xff!");
+
+  EXPECT_THAT(read("nnn"), Contains(std::string(127, 'n') + "/Speaker/PipeWire/cycles  = 0"));
+  EXPECT_THAT(read("\xef\xbf\xbd!"), Contains(EndsWith("cycles  = 0")));
+}
+
+TEST_F(GraphStatisticsTest, NodesBeyondTheMostAreLeftOut) {
+  for (std::uint32_t id = 0; id < GraphStatistics::kMostNodes; ++id) {
+    ASSERT_TRUE(graph.nodeAdded(id, "Audio/Sink", std::to_string(id)));
+  }
+
+  EXPECT_FALSE(graph.nodeAdded(5000, "Audio/Sink", "one too many"));
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

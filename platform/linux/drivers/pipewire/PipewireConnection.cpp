@@ -1,0 +1,288 @@
+#include "platform/linux/drivers/pipewire/PipewireConnection.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <string>
+#include <string_view>
+#include <system_error>
+#include <utility>
+
+#include <pipewire/extensions/profiler.h>
+#include <pipewire/impl-module.h>
+
+#include "platform/linux/drivers/DriverSourceLog.h"
+#include "platform/linux/pipewire/ProfileDecoder.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog(driversCategory, "PipewireConnection");
+
+// The first answer tells that all objects were announced, the second that all told their state.
+constexpr int kRoundTrips = 2;
+
+std::string messageOf(int error) { return std::generic_category().message(error); }
+
+std::string_view lookUp(const spa_dict* properties, const char* key) {
+  const char* value = properties == nullptr ? nullptr : spa_dict_lookup(properties, key);
+  return value == nullptr ? std::string_view() : value;
+}
+
+std::optional<NodeState> nodeState(pw_node_state state) {
+  switch (state) {
+    case PW_NODE_STATE_RUNNING:
+      return NodeState::kRunning;
+    case PW_NODE_STATE_IDLE:
+      return NodeState::kIdle;
+    case PW_NODE_STATE_SUSPENDED:
+      return NodeState::kSuspended;
+    case PW_NODE_STATE_CREATING:
+    case PW_NODE_STATE_ERROR:
+      break;
+  }
+  return std::nullopt;
+}
+
+// Only what is needed: nothing of the user's configuration, no real-time scheduling, no bus.
+pipewire::UniqueContext makeContext(pw_loop* loop) {
+  // The library warns of what is left out, unless somebody debugs it.
+  if (std::getenv("PIPEWIRE_DEBUG") == nullptr) pw_log_set_level(SPA_LOG_LEVEL_ERROR);
+  pipewire::UniqueContext context(
+      pw_context_new(loop, pw_properties_new(PW_KEY_CONFIG_NAME, "null", nullptr), 0));
+  if (context == nullptr) return nullptr;
+  if (pw_context_load_module(context.get(), "libpipewire-module-protocol-native", nullptr,
+                             nullptr) == nullptr) {
+    return nullptr;
+  }
+  if (pw_context_load_module(context.get(), PW_EXTENSION_MODULE_PROFILER, nullptr, nullptr) ==
+      nullptr) {
+    kLog.error("PipeWire's profiler module is not installed: no cycles will be counted");
+  }
+  return context;
+}
+
+}  // namespace
+
+// A sink or a source: tells its states.
+class PipewireConnection::Node {
+ public:
+  Node(PipewireConnection& connection, GlobalID id)
+      : graph_(connection.graph_),
+        id_(id),
+        binding_(connection.registry_.get(), id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE) {
+    static const pw_node_events kEvents = {
+        .version = PW_VERSION_NODE_EVENTS, .info = &Node::onInfo, .param = nullptr};
+    if (binding_.isBound()) binding_.listen(&kEvents, this);
+  }
+
+ private:
+  static void onInfo(void* data, const pw_node_info* info) {
+    auto* self = static_cast<Node*>(data);
+    if ((info->change_mask & PW_NODE_CHANGE_MASK_STATE) == 0) return;
+    const MutexLock lock(self->graph_.mutex);
+    self->graph_.statistics.nodeStateChanged(self->id_, nodeState(info->state), Clock::now());
+  }
+
+  SharedGraph& graph_;
+  const GlobalID id_;
+  pipewire::ObjectBinding binding_;
+};
+
+PipewireConnection::PipewireConnection(pw_loop* loop, SharedGraph& graph,
+                                       std::chrono::milliseconds retry)
+    : loop_(loop),
+      graph_(graph),
+      retry_(retry),
+      timer_(pw_loop_add_timer(loop, &PipewireConnection::onTimer, this)) {
+  if (timer_ != nullptr) context_ = makeContext(loop);
+  if (context_ == nullptr) kLog.error("cannot set up PipeWire's library: ", messageOf(errno));
+}
+
+PipewireConnection::~PipewireConnection() {
+  disconnect();
+  if (timer_ != nullptr) pw_loop_destroy_source(loop_, timer_);
+}
+
+void PipewireConnection::update() {
+  if (std::exchange(isLost_, false)) disconnect();
+  const bool isWanted = isLeased();
+  updateAfter(std::nullopt);
+  if (core_ == nullptr && (isWanted || !lastAttempt_.has_value())) connectWhenDue();
+  updateProfiler(isWanted);
+}
+
+bool PipewireConnection::isLeased() {
+  const MutexLock lock(graph_.mutex);
+  return !graph_.lease.expired();
+}
+
+void PipewireConnection::connectWhenDue() {
+  const Clock::time_point now = Clock::now();
+  if (!lastAttempt_.has_value() || now - *lastAttempt_ >= retry_) {
+    lastAttempt_ = now;
+    connect();
+  }
+  if (core_ == nullptr && isLeased()) updateAfter(*lastAttempt_ + retry_ - now);
+}
+
+void PipewireConnection::connect() {
+  core_.reset(pw_context_connect(
+      context_.get(), pw_properties_new(PW_KEY_APP_NAME, "halvox-reportingd", nullptr), 0));
+  if (core_ != nullptr) {
+    listen();
+    return;
+  }
+  if (!std::exchange(isMissingTold_, true)) {
+    kLog.info("no PipeWire: ", messageOf(errno), "; it is looked for while sessions run");
+  }
+  settle();
+}
+
+void PipewireConnection::listen() {
+  static const pw_core_events kCoreEvents = [] {
+    pw_core_events events{};
+    events.version = PW_VERSION_CORE_EVENTS;
+    events.info = &PipewireConnection::onCoreInfo;
+    events.done = &PipewireConnection::onCoreDone;
+    events.error = &PipewireConnection::onCoreError;
+    return events;
+  }();
+  static const pw_registry_events kRegistryEvents = {
+      .version = PW_VERSION_REGISTRY_EVENTS,
+      .global = &PipewireConnection::onGlobal,
+      .global_remove = &PipewireConnection::onGlobalRemove};
+  pw_core_add_listener(core_.get(), &coreHook_, &kCoreEvents, this);
+  registry_.reset(pw_core_get_registry(core_.get(), PW_VERSION_REGISTRY, 0));
+  pw_registry_add_listener(registry_.get(), &registryHook_, &kRegistryEvents, this);
+  isReached_ = false;
+  roundTrips_ = 0;
+  sync_ = pw_core_sync(core_.get(), PW_ID_CORE, 0);
+}
+
+void PipewireConnection::disconnect() {
+  if (core_ == nullptr) return;
+  updateProfiler(false);
+  profilerID_.reset();
+  nodes_.clear();
+  spa_hook_remove(&registryHook_);
+  registry_.reset();
+  spa_hook_remove(&coreHook_);
+  core_.reset();
+  lastAttempt_ = Clock::now();
+  settle();
+  const MutexLock lock(graph_.mutex);
+  graph_.statistics.serverLost();
+}
+
+void PipewireConnection::settle() {
+  {
+    const MutexLock lock(graph_.mutex);
+    graph_.isSettled = true;
+  }
+  graph_.settled.notifyAll();
+}
+
+void PipewireConnection::updateAfter(std::optional<Clock::duration> pause) {
+  timespec value{};
+  if (pause.has_value()) {
+    // Nothing would stop the timer.
+    const auto positive = std::max<Clock::duration>(*pause, std::chrono::milliseconds(1));
+    const auto seconds = std::chrono::floor<std::chrono::seconds>(positive);
+    value.tv_sec = seconds.count();
+    value.tv_nsec = std::chrono::nanoseconds(positive - seconds).count();
+  }
+  pw_loop_update_timer(loop_, timer_, &value, nullptr, false);
+}
+
+void PipewireConnection::updateProfiler(bool isWanted) {
+  const bool isPossible = core_ != nullptr && profilerID_.has_value();
+  if (isWanted && isPossible && profiler_ == nullptr) {
+    {
+      const MutexLock lock(graph_.mutex);
+      graph_.statistics.profilingBegan();
+    }
+    profiler_ = std::make_unique<pipewire::ProfilerBinding>(
+        registry_.get(), *profilerID_, [this](const spa_pod* profile) { onProfile(profile); });
+  } else if (!isWanted || !isPossible) {
+    profiler_.reset();
+  }
+  const MutexLock lock(graph_.mutex);
+  graph_.isProfiling = profiler_ != nullptr;
+}
+
+void PipewireConnection::onProfile(const spa_pod* profile) {
+  const auto cycles = pipewire::decodeProfile(profile);
+  const MutexLock lock(graph_.mutex);
+  for (const pipewire::ProfiledCycle& cycle : cycles) graph_.statistics.cycleEnded(cycle);
+}
+
+void PipewireConnection::onTimer(void* data, std::uint64_t /*expirations*/) {
+  static_cast<PipewireConnection*>(data)->update();
+}
+
+void PipewireConnection::onCoreInfo(void* data, const pw_core_info* info) {
+  auto* self = static_cast<PipewireConnection*>(data);
+  // It is told again when the server's properties change.
+  if (std::exchange(self->isReached_, true)) return;
+  self->isMissingTold_ = false;
+  kLog.info("following PipeWire ", info->version, " (", info->name, ")");
+  const MutexLock lock(self->graph_.mutex);
+  self->graph_.statistics.serverReached();
+}
+
+void PipewireConnection::onCoreDone(void* data, std::uint32_t id, int sequence) {
+  auto* self = static_cast<PipewireConnection*>(data);
+  if (id != PW_ID_CORE || sequence != self->sync_) return;
+  if (++self->roundTrips_ < kRoundTrips) {
+    self->sync_ = pw_core_sync(self->core_.get(), PW_ID_CORE, 0);
+  } else {
+    self->settle();
+  }
+}
+
+void PipewireConnection::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
+                                     const char* message) {
+  auto* self = static_cast<PipewireConnection*>(data);
+  if (id != PW_ID_CORE || result != -EPIPE) {
+    // An object that went before it could be asked is no news.
+    if (result != -ENOENT) kLog.info("PipeWire refused: ", message, " (object ", id, ")");
+    return;
+  }
+  if (std::exchange(self->isLost_, true)) return;
+  kLog.info("PipeWire has gone");
+  // Later, because the connection cannot be closed from within its own callback.
+  self->updateAfter(Clock::duration::zero());
+}
+
+void PipewireConnection::onGlobal(void* data, std::uint32_t id, std::uint32_t /*permissions*/,
+                                  const char* type, std::uint32_t /*version*/,
+                                  const spa_dict* properties) {
+  auto* self = static_cast<PipewireConnection*>(data);
+  const std::string_view kind = type;
+  if (kind == PW_TYPE_INTERFACE_Node) {
+    bool isWanted = false;
+    {
+      const MutexLock lock(self->graph_.mutex);
+      isWanted = self->graph_.statistics.nodeAdded(id, lookUp(properties, PW_KEY_MEDIA_CLASS),
+                                                   lookUp(properties, PW_KEY_NODE_NAME));
+    }
+    if (isWanted) self->nodes_[id] = std::make_unique<Node>(*self, id);
+  } else if (kind == PW_TYPE_INTERFACE_Profiler) {
+    self->profilerID_ = id;
+    self->updateProfiler(self->isLeased());
+  }
+}
+
+void PipewireConnection::onGlobalRemove(void* data, std::uint32_t id) {
+  auto* self = static_cast<PipewireConnection*>(data);
+  if (self->profilerID_ == id) {
+    self->profilerID_.reset();
+    self->updateProfiler(false);
+  }
+  self->nodes_.erase(id);
+  const MutexLock lock(self->graph_.mutex);
+  self->graph_.statistics.nodeRemoved(id);
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,133 @@
+#include "platform/linux/drivers/pipewire/PipewireSource.h"
+
+#include <utility>
+
+#include <pipewire/pipewire.h>
+
+#include "platform/linux/Mutex.h"
+#include "platform/linux/drivers/DriverSourceLog.h"
+#include "platform/linux/drivers/ReadingMaker.h"
+#include "platform/linux/drivers/pipewire/PipewireConnection.h"
+#include "platform/linux/drivers/pipewire/SharedGraph.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog(driversCategory, "PipewireSource");
+
+// Wakes the loop from any thread; does nothing once the loop is gone. Shared by the source and the
+// leases, which may outlive it.
+class Bell {
+ public:
+  void install(pw_loop* loop, spa_source* event) {
+    const MutexLock lock(mutex_);
+    loop_ = loop;
+    event_ = event;
+  }
+  void remove() { install(nullptr, nullptr); }
+  void ring() {
+    const MutexLock lock(mutex_);
+    if (loop_ != nullptr) pw_loop_signal_event(loop_, event_);
+  }
+
+ private:
+  Mutex mutex_;
+  pw_loop* loop_ HALVOX_GUARDED_BY(mutex_) = nullptr;
+  spa_source* event_ HALVOX_GUARDED_BY(mutex_) = nullptr;
+};
+
+// What readings hold. Rings when the last of them goes.
+class Lease {
+ public:
+  explicit Lease(std::shared_ptr<Bell> bell) : bell_(std::move(bell)) {}
+  ~Lease() { bell_->ring(); }
+  Lease(const Lease&) = delete;
+  Lease& operator=(const Lease&) = delete;
+
+ private:
+  std::shared_ptr<Bell> bell_;
+};
+
+}  // namespace
+
+class PipewireSource::Impl {
+ public:
+  explicit Impl(Options options) : options_(options) { pw_init(nullptr, nullptr); }
+  ~Impl() {
+    bell_->remove();
+    if (loop_ != nullptr) pw_thread_loop_stop(loop_);
+    connection_.reset();
+    if (event_ != nullptr) pw_loop_destroy_source(pw_thread_loop_get_loop(loop_), event_);
+    if (loop_ != nullptr) pw_thread_loop_destroy(loop_);
+    pw_deinit();
+  }
+  Impl(const Impl&) = delete;
+  Impl& operator=(const Impl&) = delete;
+
+  void open() {
+    if (!start()) {
+      kLog.error("cannot start the thread that follows PipeWire: it is left out");
+      return;
+    }
+    bell_->ring();
+    const auto deadline = std::chrono::steady_clock::now() + options_.longestOpening;
+    const MutexLock lock(graph_.mutex);
+    while (!graph_.isSettled && graph_.settled.waitUntil(graph_.mutex, deadline)) {
+    }
+  }
+
+  std::shared_ptr<const Reading> read() {
+    bool isNew = false;
+    std::shared_ptr<void> lease;
+    {
+      const MutexLock lock(graph_.mutex);
+      lease = graph_.lease.lock();
+      if (lease == nullptr) {
+        lease = std::make_shared<Lease>(bell_);
+        graph_.lease = lease;
+        isNew = true;
+      }
+      graph_.statistics.addTo(maker_, std::chrono::steady_clock::now());
+    }
+    if (isNew) bell_->ring();
+    return maker_.finish(std::move(lease));
+  }
+
+  [[nodiscard]] bool isProfiling() {
+    const MutexLock lock(graph_.mutex);
+    return graph_.isProfiling;
+  }
+
+ private:
+  bool start() {
+    // The kernel shows at most 15 letters of a thread's name.
+    loop_ = pw_thread_loop_new("halvox-pipewire", nullptr);
+    if (loop_ == nullptr) return false;
+    pw_loop* const loop = pw_thread_loop_get_loop(loop_);
+    connection_ = std::make_unique<PipewireConnection>(loop, graph_, options_.retry);
+    if (!connection_->isUsable()) return false;
+    event_ = pw_loop_add_event(loop, &Impl::onRing, this);
+    if (event_ == nullptr || pw_thread_loop_start(loop_) != 0) return false;
+    bell_->install(loop, event_);
+    return true;
+  }
+  static void onRing(void* data, std::uint64_t /*count*/) {
+    static_cast<Impl*>(data)->connection_->update();
+  }
+
+  const Options options_;
+  const std::shared_ptr<Bell> bell_ = std::make_shared<Bell>();
+  SharedGraph graph_;
+  ReadingMaker maker_;  // of the thread of readings
+  pw_thread_loop* loop_ = nullptr;
+  spa_source* event_ = nullptr;
+  std::unique_ptr<PipewireConnection> connection_;
+};
+
+PipewireSource::PipewireSource(Options options) : impl_(std::make_unique<Impl>(options)) {}
+PipewireSource::~PipewireSource() = default;
+void PipewireSource::open() { impl_->open(); }
+std::shared_ptr<const Reading> PipewireSource::read() { return impl_->read(); }
+bool PipewireSource::isProfiling() const { return impl_->isProfiling(); }
+
+}  // namespace halvox::platform::linux_

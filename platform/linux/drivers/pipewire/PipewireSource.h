@@ -1,0 +1,46 @@
+#pragma once
+
+#include <chrono>
+#include <memory>
+
+#include "platform/linux/drivers/DriverSource.h"
+
+namespace halvox::platform::linux_ {
+
+// What a PipeWire server counts of its sinks (group "Speaker") and sources (group "Rx"): cycles,
+// xruns, the times of each cycle, and the states of the nodes.
+//
+// The server is followed on a thread of the library's own, which sleeps until the server tells
+// something: while nobody holds a reading, only that nodes come, go or change their state. Its
+// profiler, which tells of each cycle, is bound while somebody holds a reading, so a node's cycles
+// are those of such times; the first reading begins one.
+//
+// When there is no server, it is looked for whenever a reading is asked for and every `retry` as
+// long as somebody holds one, never more often; the same when the server goes. Until it is there,
+// the only channels are "connections", which count how often it was reached.
+class PipewireSource final : public DriverSource {
+ public:
+  struct Options {
+    std::chrono::milliseconds retry{5000};
+    // How long open() waits for what the server has.
+    std::chrono::milliseconds longestOpening{800};
+  };
+
+  PipewireSource() : PipewireSource(Options()) {}
+  explicit PipewireSource(Options options);
+  ~PipewireSource() override;
+
+  [[nodiscard]] std::string_view name() const override { return "pipewire"; }
+  void open() override;
+  // Never waits for the server.
+  [[nodiscard]] std::shared_ptr<const Reading> read() override;
+
+  // Whether the profiler is bound at the moment. Any thread.
+  [[nodiscard]] bool isProfiling() const;
+
+ private:
+  class Impl;
+  std::unique_ptr<Impl> impl_;
+};
+
+}  // namespace halvox::platform::linux_

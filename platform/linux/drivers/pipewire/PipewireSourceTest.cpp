@@ -1,0 +1,205 @@
+#include "platform/linux/drivers/pipewire/PipewireSource.h"
+
+#include <algorithm>
+#include <functional>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <stdlib.h>
+
+#include "platform/fake/FakePlatform.h"
+#include "platform/linux/drivers/DriverTesting.h"
+#include "reporters/pipewire/PrivatePipeWire.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using namespace std::chrono_literals;
+using pipewire_reporter::ChildProcess;
+using pipewire_reporter::PrivatePipeWire;
+using ::testing::ElementsAre;
+using Clock = std::chrono::steady_clock;
+
+constexpr auto kDeadline = 30s;
+
+// Asks again and again until it is so; false at the deadline.
+bool waitUntil(const std::function<bool()>& condition) {
+  const auto end = Clock::now() + kDeadline;
+  while (!condition()) {
+    if (Clock::now() > end) return false;
+    std::this_thread::sleep_for(10ms);
+  }
+  return true;
+}
+
+std::vector<std::string> linesOf(const std::shared_ptr<const Reading>& reading,
+                                 std::string_view start = "") {
+  std::vector<std::string> lines = testing::describe(testing::samplesOf(reading));
+  std::erase_if(lines, [start](const std::string& line) { return !line.starts_with(start); });
+  return lines;
+}
+
+// The value of a simple channel; -1 when it is not there.
+std::int64_t valueOf(const std::shared_ptr<const Reading>& reading, std::string_view start) {
+  std::int64_t value = -1;
+  testing::samplesOf(reading).iterate([&](const IOReportChannel& channel) {
+    if (testing::describe(channel).starts_with(start)) value = channel.integerValue;
+    return 0;
+  });
+  return value;
+}
+
+// What the histogram's buckets were hit, and the channel's greatest value.
+struct Seen {
+  std::uint64_t hits = 0;
+  std::int64_t greatest = 0;
+};
+Seen histogramOf(const std::shared_ptr<const Reading>& reading, std::string_view start) {
+  Seen seen;
+  testing::samplesOf(reading).iterate([&](const IOReportChannel& channel) {
+    if (!testing::describe(channel).starts_with(start)) return 0;
+    for (const auto& bucket : channel.buckets) seen.hits += bucket.hits;
+    seen.greatest = channel.maxValue;
+    return 0;
+  });
+  return seen;
+}
+
+constexpr std::string_view kCycles = "demo-speakers/Speaker/PipeWire/cycles";
+
+// Without a server to ask.
+TEST(PipewireSourceAloneTest, OnlyTheConnectionsAreThereAndOpeningDoesNotWait) {
+  const FakePlatform platform;
+  const testing::TemporaryDirectory directory;
+  setenv("XDG_RUNTIME_DIR", directory.path().c_str(), 1);
+  PipewireSource source;
+  const auto start = Clock::now();
+
+  source.open();
+  const auto reading = source.read();
+
+  EXPECT_LT(Clock::now() - start, 500ms);
+  EXPECT_THAT(linesOf(reading), ElementsAre("pipewire/Speaker/PipeWire/connections  = 0",
+                                            "pipewire/Rx/PipeWire/connections  = 0"));
+  EXPECT_FALSE(source.isProfiling());
+}
+
+TEST(PipewireSourceAloneTest, AReadingMayOutliveTheSource) {
+  const FakePlatform platform;
+  std::shared_ptr<const Reading> reading;
+  {
+    PipewireSource source;
+    source.open();
+    reading = source.read();
+  }
+
+  EXPECT_GE(reading->values.size(), 2U);
+}
+
+class PipewireSourceTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    if (const auto missing = PrivatePipeWire::missingTools(); !missing.empty()) {
+      GTEST_SKIP() << missing;
+    }
+    audio = std::make_unique<PrivatePipeWire>();
+    ASSERT_TRUE(audio->isReady());
+    source = std::make_unique<PipewireSource>(PipewireSource::Options{.retry = 100ms});
+    source->open();
+  }
+  void TearDown() override { source.reset(); }
+
+  [[nodiscard]] ChildProcess play(double seconds) const {
+    return ChildProcess({"pw-play", "--volume", "0.5", audio->makeTone(seconds)});
+  }
+
+  FakePlatform platform;
+  std::unique_ptr<PrivatePipeWire> audio;
+  std::unique_ptr<PipewireSource> source;
+};
+
+TEST_F(PipewireSourceTest, TheFirstReadingHasTheNodesAndTheirStates) {
+  const auto reading = source->read();
+
+  EXPECT_EQ(valueOf(reading, "pipewire/Speaker/PipeWire/connections"), 1);
+  EXPECT_EQ(valueOf(reading, kCycles), 0);
+  EXPECT_EQ(linesOf(reading, "demo-speakers/").size(), 5U);
+  // It is in some state, and for some time.
+  EXPECT_THAT(linesOf(source->read(), "demo-speakers/Speaker/PipeWire/state us"),
+              ElementsAre(::testing::MatchesRegex(".*= (idle|suspended):0:[1-9][0-9]*")));
+}
+
+TEST_F(PipewireSourceTest, CyclesOfAPlaybackAreCountedWhileAReadingIsHeld) {
+  const auto first = source->read();
+  ASSERT_TRUE(waitUntil([&] { return source->isProfiling(); }));
+  ChildProcess player = play(2);
+
+  ASSERT_EQ(player.wait(), 0);
+  // 2 s of cycles of at most 2048 frames.
+  ASSERT_TRUE(waitUntil([&] { return valueOf(source->read(), kCycles) >= 46; }));
+
+  const auto last = source->read();
+  const auto cycles = static_cast<std::uint64_t>(valueOf(last, kCycles));
+  const Seen busy = histogramOf(last, "demo-speakers/Speaker/PipeWire/busy time us");
+  const Seen wait = histogramOf(last, "demo-speakers/Speaker/PipeWire/wait time us");
+  EXPECT_GE(busy.hits, cycles * 9 / 10);
+  EXPECT_LE(busy.hits, cycles);
+  EXPECT_GE(wait.hits, cycles * 9 / 10);
+  EXPECT_LT(busy.greatest, 10'000'000);
+  EXPECT_THAT(linesOf(last, "demo-speakers/Speaker/PipeWire/state us"),
+              ElementsAre(::testing::HasSubstr(" running:1:")));
+}
+
+TEST_F(PipewireSourceTest, TheProfilerIsBoundOnlyWhileReadingsAreHeld) {
+  EXPECT_FALSE(source->isProfiling());
+  auto first = source->read();
+  auto second = source->read();
+  ASSERT_TRUE(waitUntil([&] { return source->isProfiling(); }));
+
+  first.reset();
+  const ChildProcess player = play(20);
+  ASSERT_TRUE(waitUntil([&] { return valueOf(source->read(), kCycles) > 0; }));
+  EXPECT_TRUE(source->isProfiling());
+  second.reset();
+
+  EXPECT_TRUE(waitUntil([&] { return !source->isProfiling(); }));
+}
+
+TEST_F(PipewireSourceTest, ASourceHasItsChannelsInItsGroupAndLosesThemWhenItGoes) {
+  constexpr std::string_view kSource = "demo-microphone/Rx/PipeWire/cycles";
+  ASSERT_EQ(valueOf(source->read(), kSource), -1);
+
+  {
+    ChildProcess creator({"pw-cli"});
+    creator.writeLine(
+        "create-node adapter { factory.name=support.null-audio-sink node.name=demo-microphone "
+        "media.class=Audio/Source/Virtual audio.position=[ MONO ] }");
+    ASSERT_TRUE(waitUntil([&] { return valueOf(source->read(), kSource) == 0; }));
+  }
+
+  EXPECT_TRUE(waitUntil([&] { return valueOf(source->read(), kSource) == -1; }));
+}
+
+TEST_F(PipewireSourceTest, ARestartedServerIsFoundAgainAndCountedFromZero) {
+  const auto held = source->read();
+  {
+    ChildProcess player = play(0.5);
+    ASSERT_EQ(player.wait(), 0);
+  }
+  ASSERT_TRUE(waitUntil([&] { return valueOf(source->read(), kCycles) > 0; }));
+
+  ASSERT_TRUE(audio->restart());
+
+  const auto isBack = [&] {
+    return valueOf(source->read(), "pipewire/Speaker/PipeWire/connections") == 2 &&
+           valueOf(source->read(), kCycles) == 0;
+  };
+  EXPECT_TRUE(waitUntil(isBack));
+  EXPECT_TRUE(waitUntil([&] { return source->isProfiling(); }));
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_
