@@ -11,7 +11,12 @@ namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 constexpr std::chrono::milliseconds kLibraryEndTime{2000};
+constexpr std::int64_t kDefaultSpin = -1;
 constexpr std::string_view kErrorDomain = "com.tarno.halvox.link";
+
+Error refuse(std::string description) {
+  return {.domain = std::string(kErrorDomain), .code = 1, .description = std::move(description)};
+}
 
 }  // namespace
 
@@ -21,7 +26,14 @@ NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environme
       statistics_(environment.statistics),
       received_(statistics_.counter(kNatsPiece, "received")),
       acknowledged_(statistics_.counter(kNatsPiece, "acknowledged")),
-      notAcknowledged_(statistics_.counter(kNatsPiece, "not acknowledged")) {}
+      notAcknowledged_(statistics_.counter(kNatsPiece, "not acknowledged")),
+      publishedAgain_(statistics_.counter(kNatsPiece, "published again")) {
+  // Connecting would open the library, too, but the first message is made, and may be destroyed,
+  // before that.
+  if (const natsStatus status = nats_Open(kDefaultSpin); status != NATS_OK) {
+    kLog.error("the client library of the link does not start: ", natsStatus_GetText(status));
+  }
+}
 
 NatsLink::~NatsLink() { close(); }
 
@@ -59,10 +71,6 @@ void NatsLink::expire(std::uint64_t waiter) {
 }
 
 std::optional<Error> NatsLink::refusal(const OutgoingMessage& message) {
-  const auto refuse = [](std::string description) {
-    return Error{
-        .domain = std::string(kErrorDomain), .code = 1, .description = std::move(description)};
-  };
   if (closeBy_) return refuse("the service is ending");
   if (maxPayload_ > 0 && message.bytes > maxPayload_) {
     return refuse("a message of " + std::to_string(message.bytes) + " bytes is more than the " +
@@ -78,6 +86,18 @@ std::optional<Error> NatsLink::refusal(const OutgoingMessage& message) {
   return std::nullopt;
 }
 
+void NatsLink::countRefused() { statistics_.counter(kNatsPiece, "failed: refused").add(); }
+
+std::optional<Error> NatsLink::refuseAtEnd() {
+  {
+    const MutexLock lock(mutex_);
+    if (!closeBy_) return std::nullopt;
+  }
+  received_.add();
+  countRefused();
+  return refuse("the service is ending");
+}
+
 std::optional<Error> NatsLink::send(OutgoingMessage message) {
   received_.add();
   std::optional<Error> error;
@@ -91,7 +111,7 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
       return std::nullopt;
     }
   }
-  statistics_.counter(kNatsPiece, "failed: refused").add();
+  countRefused();
   if (message.ledger) message.ledger->resolve(message.number, AckOutcome::kRefused);
   return error;
 }
@@ -103,8 +123,7 @@ void NatsLink::close() {
     closeBy_ = std::chrono::steady_clock::now() + kCloseTime;
     changed_.notifyAll();
   }
-  if (!thread_.joinable()) return;
-  thread_.join();
+  if (thread_.joinable()) thread_.join();
   // After this no callback of the library runs; if it does not end, they may still find this here.
   if (nats_CloseAndWait(kLibraryEndTime.count()) == NATS_OK) return;
   kLog.error("the client library of the link did not end in time");
@@ -121,31 +140,50 @@ void NatsLink::wakeThread() {
   }
 }
 
-NatsLink::Step NatsLink::nextStepClosing(Time now) {
-  if (!connection_ || isLost_ || now >= *closeBy_) return Step::kEnd;
-  if (queue_.empty() && pending_.size() == 0) return Step::kEnd;
-  const bool canSend = !queue_.empty() && !isBufferFull_ && !isWindowFull_;
-  return canSend ? Step::kSend : Step::kWait;
+// Whether there is nothing left to do after close(), or no time.
+bool NatsLink::isAtEnd(Time now) {
+  if (!closeBy_) return false;
+  const bool isAllDone = queue_.empty() && pending_.size() == 0;
+  return !connection_ || isLost_ || isAllDone || now >= *closeBy_;
+}
+
+NatsLink::Step NatsLink::nextStepConnected(Time now) {
+  if (pending_.size() == 0) flow_ = Flow::kFlowing;
+  if (flow_ == Flow::kProbing) return Step::kWait;
+  if (flow_ == Flow::kHolding) return now >= probeAt_ ? Step::kProbe : Step::kWait;
+  if (pending_.needsAgain()) return pending_.hasAgain() ? Step::kSend : Step::kWait;
+  return !queue_.empty() && !isWindowFull_ ? Step::kSend : Step::kWait;
 }
 
 NatsLink::Step NatsLink::nextStep(Time now) {
   if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
-  if (closeBy_) return nextStepClosing(now);
+  if (isAtEnd(now)) return Step::kEnd;
   if (isLost_) return Step::kDrop;
+  if (const auto deadline = pending_.firstDeadline(); deadline && now >= *deadline) {
+    return Step::kGiveUp;
+  }
   if (isConnected_ && !waiters_.empty()) return Step::kAnswer;
   if (!connection_) {
     const bool isNeeded = !waiters_.empty() || !queue_.empty();
     return isNeeded && now >= nextAttempt_ ? Step::kConnect : Step::kWait;
   }
-  return !queue_.empty() && !isBufferFull_ && !isWindowFull_ ? Step::kSend : Step::kWait;
+  return isConnected_ ? nextStepConnected(now) : Step::kWait;
+}
+
+// When there is something to do even if nothing changes.
+std::optional<NatsLink::Time> NatsLink::nextTime() {
+  std::optional<Time> next = closeBy_;
+  const auto consider = [&next](Time time) { next = std::min(next.value_or(time), time); };
+  if (const auto deadline = pending_.firstDeadline()) consider(*deadline);
+  if (isConnected_ && flow_ == Flow::kHolding) consider(probeAt_);
+  if (!connection_ && (!waiters_.empty() || !queue_.empty())) consider(nextAttempt_);
+  return next;
 }
 
 void NatsLink::waitForChange() {
   isIdle_ = true;
-  if (closeBy_) {
-    changed_.waitUntil(mutex_, *closeBy_);
-  } else if (!connection_ && (!waiters_.empty() || !queue_.empty())) {
-    changed_.waitUntil(mutex_, nextAttempt_);
+  if (const auto time = nextTime()) {
+    changed_.waitUntil(mutex_, *time);
   } else {
     changed_.wait(mutex_);
   }
@@ -170,13 +208,20 @@ void NatsLink::run() {
       case Step::kConnect:
         connect();
         break;
+      case Step::kProbe:
+        probe();
+        break;
       case Step::kSend:
         publishSome();
+        break;
+      case Step::kGiveUp:
+        giveUpOverdue();
         break;
       case Step::kDrop:
         dropConnection();
         break;
       case Step::kEnd:
+        drain();
         dropConnection();
         answerWaiters();
         nats_ReleaseThreadMemory();

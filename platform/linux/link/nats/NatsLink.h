@@ -6,6 +6,7 @@
 #include <deque>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <thread>
@@ -38,10 +39,23 @@ struct OutgoingMessage {
 // Whoever asks for servers waits for the one attempt that is under way, at most kDiscoveryTime.
 // After a failed attempt the next one begins kAttemptPause later, and only when somebody asks.
 //
-// Messages wait in a queue bounded in bytes. While servers are away the library's own buffer
-// takes the first of them; when that and the queue are full, messages are refused with an error.
-// Nothing is sent a second time: to send a lost message again would put it behind later ones of its
-// session. What was on its way when a connection broke is counted as not acknowledged.
+// Messages wait in a queue bounded in bytes; when it is full, they are refused with an error. While
+// servers are away they wait there and not in the library's buffer, because what was on its way
+// when the connection broke has to go first:
+//
+//   flowing --no responders, no acknowledgement, connection lost--> holding
+//      ^                                                            |     ^
+//      +--- acknowledged --- probing <--- kResendPause later -------+     |
+//                               +------------- failed --------------------+
+//
+// Holding, nothing is published. Then the oldest message that is not acknowledged is published
+// again; once a server confirms it, all others follow in order, and then new ones. The stream knows
+// a message that it has by its identifier, and confirms it without storing it twice. So the
+// messages of a session keep their order, also when the stream's leader is lost. A message that is
+// not confirmed within kAckTime of its first attempt is given up, and counted as not acknowledged.
+//
+// Only a stream whose leader changes in less time than a message takes to the server and back can
+// take a later message before one that it had no leader for.
 //
 // All functions may be called by any thread, and none waits for a server but close().
 class NatsLink : public std::enable_shared_from_this<NatsLink> {
@@ -49,9 +63,9 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   static constexpr std::chrono::seconds kDiscoveryTime{8};
   static constexpr std::chrono::seconds kAttemptPause{1};
   static constexpr std::chrono::seconds kCloseTime{3};
-  static constexpr std::chrono::seconds kAckTime{10};
+  static constexpr std::chrono::seconds kAckTime{30};
+  static constexpr std::chrono::milliseconds kResendPause{100};
   static constexpr std::size_t kQueueBytes = 32U << 20U;
-  static constexpr int kReconnectBufferBytes = 8 << 20;
 
   NatsLink(Configuration::Link options, const NatsEnvironment& environment);
   NatsLink(const NatsLink&) = delete;
@@ -61,6 +75,8 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
 
   // Calls back once with the servers' addresses, or none.
   void discover(TLMReportingService::BackendsCallback found) HALVOX_EXCLUDES(mutex_);
+  // Why no message is taken any more; it must not even be made then, as the library has ended.
+  [[nodiscard]] std::optional<Error> refuseAtEnd() HALVOX_EXCLUDES(mutex_);
   // Takes the message, or says why not.
   [[nodiscard]] std::optional<Error> send(OutgoingMessage message) HALVOX_EXCLUDES(mutex_);
   // Lets what was taken go out, at most kCloseTime, then ends the connection and the library.
@@ -72,28 +88,40 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
     std::uint64_t id;
     TLMReportingService::BackendsCallback found;
   };
-  enum class Step : std::uint8_t { kWait, kAnswer, kConnect, kSend, kDrop, kEnd };
+  enum class Step : std::uint8_t { kWait, kAnswer, kConnect, kProbe, kSend, kGiveUp, kDrop, kEnd };
+  enum class Flow : std::uint8_t { kFlowing, kHolding, kProbing };
 
   // The thread (NatsLink.cpp).
   void run() HALVOX_EXCLUDES(mutex_);
   Step nextStep(Time now) HALVOX_REQUIRES(mutex_);
-  Step nextStepClosing(Time now) HALVOX_REQUIRES(mutex_);
+  [[nodiscard]] bool isAtEnd(Time now) HALVOX_REQUIRES(mutex_);
+  Step nextStepConnected(Time now) HALVOX_REQUIRES(mutex_);
+  std::optional<Time> nextTime() HALVOX_REQUIRES(mutex_);
   void waitForChange() HALVOX_REQUIRES(mutex_);
   void wakeThread() HALVOX_REQUIRES(mutex_);
   void answerWaiters() HALVOX_EXCLUDES(mutex_);
   void expire(std::uint64_t waiter) HALVOX_EXCLUDES(mutex_);
+  void countRefused();
   [[nodiscard]] std::optional<Error> refusal(const OutgoingMessage& message)
       HALVOX_REQUIRES(mutex_);
 
   // Publishing and what becomes of it (NatsLinkPublishing.cpp).
   void publishSome() HALVOX_EXCLUDES(mutex_);
-  std::vector<OutgoingMessage> takeSome() HALVOX_REQUIRES(mutex_);
-  void putBack(std::vector<OutgoingMessage> messages, std::size_t first) HALVOX_EXCLUDES(mutex_);
+  void probe() HALVOX_EXCLUDES(mutex_);
+  void reclaim() HALVOX_EXCLUDES(mutex_);
+  void giveUpOverdue() HALVOX_EXCLUDES(mutex_);
+  std::vector<NatsMessage> takeSome() HALVOX_REQUIRES(mutex_);
+  void publish(std::vector<NatsMessage> messages, std::chrono::milliseconds patience)
+      HALVOX_EXCLUDES(mutex_);
+  void hold(std::span<NatsMessage> messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
+  void beginHolding(Time until) HALVOX_REQUIRES(mutex_);
   static void onAcknowledged(jsCtx* context, natsMsg* message, jsPubAck* ack, jsPubAckErr* error,
                              void* link);
   void resolve(NatsMessage message, const jsPubAckErr* error) HALVOX_EXCLUDES(mutex_);
+  void settle(const PendingAcks::Entry& entry, const jsPubAckErr* error) HALVOX_EXCLUDES(mutex_);
   void countFailure(std::uint64_t messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
-  void abandon(std::vector<PendingAcks::Entry> entries) HALVOX_EXCLUDES(mutex_);
+  void abandon(std::vector<PendingAcks::Entry> entries, std::string_view reason)
+      HALVOX_EXCLUDES(mutex_);
   void fail(std::deque<OutgoingMessage> messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
 
   // The connection (NatsLinkConnection.cpp).
@@ -102,6 +130,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   [[nodiscard]] natsStatus configure(natsOptions* options);
   [[nodiscard]] natsStatus secure(natsOptions* options);
   [[nodiscard]] std::string provideStream(jsCtx* context);
+  void drain() HALVOX_EXCLUDES(mutex_);
   void dropConnection() HALVOX_EXCLUDES(mutex_);
   void onAvailable(natsConnection* connection) HALVOX_EXCLUDES(mutex_);
   void onAway(natsConnection* connection) HALVOX_EXCLUDES(mutex_);
@@ -113,14 +142,16 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   Counter& received_;
   Counter& acknowledged_;
   Counter& notAcknowledged_;
+  Counter& publishedAgain_;  // attempts, not messages
 
   Mutex mutex_;
   Condition changed_;
   bool isIdle_ HALVOX_GUARDED_BY(mutex_) = false;  // the thread waits for a change
   bool isConnected_ HALVOX_GUARDED_BY(mutex_) = false;
-  bool isLost_ HALVOX_GUARDED_BY(mutex_) = false;        // the library gave the connection up
-  bool isBufferFull_ HALVOX_GUARDED_BY(mutex_) = false;  // that of the library, while away
+  bool isLost_ HALVOX_GUARDED_BY(mutex_) = false;  // the library gave the connection up
   bool isWindowFull_ HALVOX_GUARDED_BY(mutex_) = false;
+  Flow flow_ HALVOX_GUARDED_BY(mutex_) = Flow::kFlowing;
+  Time probeAt_ HALVOX_GUARDED_BY(mutex_){};  // while holding
   std::optional<Time> closeBy_ HALVOX_GUARDED_BY(mutex_);
   Time nextAttempt_ HALVOX_GUARDED_BY(mutex_){};
   std::string lastFailure_ HALVOX_GUARDED_BY(mutex_);  // empty when the last attempt succeeded
@@ -133,7 +164,10 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   PendingAcks pending_ HALVOX_GUARDED_BY(mutex_){AckWindow{}};
   BurstLog failureLog_ HALVOX_GUARDED_BY(mutex_);
   BurstLog attemptLog_ HALVOX_GUARDED_BY(mutex_);
+  BurstLog holdLog_ HALVOX_GUARDED_BY(mutex_);
 
+  // How long a message is published again; the thread's alone.
+  std::chrono::nanoseconds ackTime_ = kAckTime;
   // Changed by the thread alone, under the lock; other threads only compare the connection.
   NatsConnection connection_;
   JetStreamContext context_;

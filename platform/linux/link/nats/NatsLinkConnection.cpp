@@ -25,7 +25,14 @@ constexpr int kForEver = -1;
 // What the stream keeps when this service makes it. Whoever wants other limits makes it first.
 constexpr std::int64_t kStreamBytes = std::int64_t{4} << 30;
 constexpr std::chrono::nanoseconds kStreamAge = std::chrono::hours(24 * 30);
+// For so long the stream knows its messages again; whatever is published again is so within half of
+// it.
 constexpr std::chrono::nanoseconds kDuplicatesTime = std::chrono::minutes(2);
+static_assert(kDuplicatesTime >= 2 * NatsLink::kAckTime);
+
+// The library shall keep nothing while the servers are away, see NatsLink; it takes no 0 for that.
+constexpr int kReconnectBufferBytes = 1;
+constexpr std::chrono::milliseconds kDrainTime{1000};
 
 std::string describe(natsStatus status) {
   natsStatus last = NATS_OK;
@@ -116,7 +123,12 @@ std::string NatsLink::provideStream(jsCtx* context) {
   jsErrCode code{};
   natsStatus status =
       js_GetStreamInfo(info.out(), context, options_.stream.c_str(), nullptr, &code);
-  if (status == NATS_OK) return {};  // as it is, whatever it was made for
+  ackTime_ = kAckTime;
+  if (status == NATS_OK) {  // as it is, whatever it was made for
+    const std::chrono::nanoseconds duplicates(info.get()->Config->Duplicates);
+    ackTime_ = std::min<std::chrono::nanoseconds>(kAckTime, duplicates / 2);
+    return {};
+  }
   if (status != NATS_NOT_FOUND && code != JSStreamNotFoundErr) {
     return "stream " + options_.stream + ": " + describe(status);
   }
@@ -187,6 +199,18 @@ void NatsLink::connect() {
   answerWaiters();
 }
 
+// Lets the library's threads return from all calls of ours. Ended before that, it leaves a message
+// behind which one of them was about to free.
+void NatsLink::drain() {
+  natsConnection* const connection = connection_.get();
+  if (connection == nullptr) return;
+  if (natsConnection_Status(connection) != NATS_CONN_STATUS_CONNECTED) return;
+  if (natsConnection_DrainTimeout(connection, kDrainTime.count()) != NATS_OK) return;
+  const Time end = std::chrono::steady_clock::now() + 2 * kDrainTime;
+  const MutexLock lock(mutex_);
+  while (!isLost_ && std::chrono::steady_clock::now() < end) changed_.waitUntil(mutex_, end);
+}
+
 void NatsLink::dropConnection() {
   NatsConnection connection;
   JetStreamContext context;
@@ -198,8 +222,8 @@ void NatsLink::dropConnection() {
     context = std::move(context_);
     isConnected_ = false;
     isLost_ = false;
-    isBufferFull_ = false;
     isWindowFull_ = false;
+    flow_ = Flow::kFlowing;
     maxPayload_ = 0;
     servers_ = Array();
     lost = pending_.takeAll();
@@ -208,7 +232,7 @@ void NatsLink::dropConnection() {
   if (connection) natsConnection_Close(connection.get());
   context.reset();
   connection.reset();
-  abandon(std::move(lost));
+  abandon(std::move(lost), "the connection ended");
   fail(std::move(unsent), "the service ended");
 }
 
@@ -219,7 +243,6 @@ void NatsLink::onAvailable(natsConnection* connection) {
   const MutexLock lock(mutex_);
   if (connection != connection_.get() || !isConnected) return;
   isConnected_ = true;
-  isBufferFull_ = false;
   servers_ = servers;
   maxPayload_ = static_cast<std::size_t>(std::max<std::int64_t>(maxPayload, 0));
   changed_.notifyAll();
@@ -230,8 +253,7 @@ void NatsLink::onAway(natsConnection* connection) {
     const MutexLock lock(mutex_);
     if (connection != connection_.get()) return;
     isConnected_ = false;
-    isWindowFull_ = false;
-    pending_.beginEpoch();
+    beginHolding(std::chrono::steady_clock::now());
     changed_.notifyAll();
   }
   kLog.notice("the link lost its server and looks for it");

@@ -1,3 +1,4 @@
+#include <span>
 #include <string>
 #include <utility>
 
@@ -12,18 +13,46 @@ constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 // Messages that are published under one hold of the lock before and none while publishing.
 constexpr std::size_t kMessagesAtOnce = 64;
 
+// How long an acknowledgement may take before the message counts as lost on the way: much longer
+// than a busy server needs, but short enough to come through within the time of a flush.
+constexpr std::chrono::milliseconds kAttemptTime{3000};
+constexpr std::chrono::milliseconds kProbeTime{1000};
+
+// Whether another attempt can succeed where this one failed.
+bool isTemporary(natsStatus status, jsErrCode code = {}) {
+  switch (status) {
+    case NATS_NO_RESPONDERS:
+    case NATS_TIMEOUT:
+    case NATS_INSUFFICIENT_BUFFER:
+    case NATS_CONNECTION_CLOSED:
+    case NATS_CONNECTION_DISCONNECTED:
+    case NATS_IO_ERROR:
+    case NATS_STALE_CONNECTION:
+      return true;
+    default:  // a status of the library, which gains some
+      return code == JSClusterNotAvailErr || code == JSClusterNotLeaderErr;
+  }
+}
+
 }  // namespace
 
 // Their acknowledgements are expected from here on, because the first can be there before the call
 // that publishes it has returned.
-std::vector<OutgoingMessage> NatsLink::takeSome() {
-  std::vector<OutgoingMessage> taken;
+std::vector<NatsMessage> NatsLink::takeSome() {
+  std::vector<NatsMessage> taken;
   taken.reserve(kMessagesAtOnce);
-  while (!queue_.empty() && taken.size() < kMessagesAtOnce && pending_.hasRoom()) {
+  while (taken.size() < kMessagesAtOnce && pending_.hasAgain()) {
+    taken.push_back(pending_.nextAgain());
+  }
+  publishedAgain_.add(taken.size());
+  const Time deadline = std::chrono::steady_clock::now() +
+                        std::chrono::duration_cast<std::chrono::steady_clock::duration>(ackTime_);
+  while (!queue_.empty() && taken.size() < kMessagesAtOnce && pending_.hasRoom() &&
+         !pending_.needsAgain()) {
     OutgoingMessage& next = queue_.front();
     queuedBytes_ -= next.bytes;
-    pending_.add(next.message.get(), {next.ledger, next.number, next.bytes});
-    taken.push_back(std::move(next));
+    pending_.add(next.message.get(), {std::move(next.ledger), next.number, next.bytes, deadline});
+    taken.push_back(std::move(next.message));
     queue_.pop_front();
   }
   isWindowFull_ = !pending_.hasRoom();
@@ -31,42 +60,103 @@ std::vector<OutgoingMessage> NatsLink::takeSome() {
 }
 
 void NatsLink::publishSome() {
-  std::vector<OutgoingMessage> messages;
+  std::vector<NatsMessage> messages;
   {
     const MutexLock lock(mutex_);
     messages = takeSome();
   }
+  publish(std::move(messages), kAttemptTime);
+}
+
+// Publishes the oldest message again, and nothing else until a server confirms it.
+void NatsLink::probe() {
+  reclaim();
+  std::vector<NatsMessage> messages;
+  {
+    const MutexLock lock(mutex_);
+    pending_.beginAgain();
+    if (!pending_.hasAgain()) {  // it is settled, or is so in a moment
+      probeAt_ = std::chrono::steady_clock::now() + kResendPause;
+      return;
+    }
+    flow_ = Flow::kProbing;
+    messages.push_back(pending_.nextAgain());
+  }
+  publishedAgain_.add();
+  publish(std::move(messages), kProbeTime);
+}
+
+// Takes back what the library still awaits acknowledgements for.
+void NatsLink::reclaim() {
+  natsMsgList list{};
+  if (js_PublishAsyncGetPendingList(&list, context_.get()) != NATS_OK) return;
+  {
+    const MutexLock lock(mutex_);
+    for (natsMsg*& message : std::span(list.Msgs, static_cast<std::size_t>(list.Count))) {
+      (void)pending_.giveBack(NatsMessage(std::exchange(message, nullptr)));
+    }
+  }
+  natsMsgList_Destroy(&list);
+}
+
+void NatsLink::publish(std::vector<NatsMessage> messages, std::chrono::milliseconds patience) {
   jsPubOptions publishing;
   jsPubOptions_Init(&publishing);
-  publishing.MaxWait = std::chrono::milliseconds(kAckTime).count();
+  publishing.MaxWait = patience.count();
   for (std::size_t index = 0; index < messages.size(); ++index) {
-    natsMsg* raw = messages[index].message.release();
+    natsMsg* raw = messages[index].release();
     natsMsg* const key = raw;
     const natsStatus status = js_PublishMsgAsync(context_.get(), &raw, &publishing);
     if (status == NATS_OK) continue;
-    messages[index].message.reset(raw);
-    if (status == NATS_INSUFFICIENT_BUFFER || status == NATS_CONNECTION_CLOSED) {
-      return putBack(std::move(messages), index);
+    messages[index].reset(raw);
+    if (isTemporary(status)) {
+      return hold(std::span(messages).subspan(index), natsStatus_GetText(status));
     }
     const jsPubAckErr error{.Msg = key, .Err = status, .ErrCode = {}, .ErrText = nullptr};
-    resolve(std::move(messages[index].message), &error);
+    resolve(std::move(messages[index]), &error);
   }
 }
 
-void NatsLink::putBack(std::vector<OutgoingMessage> messages, std::size_t first) {
-  const MutexLock lock(mutex_);
-  // A connection that came back meanwhile, or is lost for good, is seen before the next attempt.
-  isBufferFull_ = !isConnected_;
-  for (std::size_t index = messages.size(); index > first; --index) {
-    OutgoingMessage& message = messages[index - 1];
-    (void)pending_.take(message.message.get());
-    queuedBytes_ += message.bytes;
-    queue_.push_front(std::move(message));
+// Keeps messages whose attempt failed, and all later ones, for another attempt.
+void NatsLink::hold(std::span<NatsMessage> messages, std::string_view reason) {
+  std::optional<std::uint64_t> worthALine;
+  {
+    const MutexLock lock(mutex_);
+    bool isKnown = flow_ == Flow::kProbing;
+    for (NatsMessage& message : messages) {
+      isKnown = pending_.giveBack(std::move(message)) || isKnown;
+    }
+    if (!isKnown || flow_ == Flow::kHolding) return;
+    const Time now = std::chrono::steady_clock::now();
+    beginHolding(now + kResendPause);
+    worthALine = holdLog_.note(1, now);
+    changed_.notifyAll();
   }
+  if (worthALine) kLog.notice("messages of the link wait to be published again: ", reason);
+}
+
+void NatsLink::beginHolding(Time until) {
+  if (pending_.size() == 0) return;
+  flow_ = Flow::kHolding;
+  probeAt_ = until;
+}
+
+void NatsLink::giveUpOverdue() {
+  std::vector<PendingAcks::Entry> overdue;
+  {
+    const MutexLock lock(mutex_);
+    overdue = pending_.takeOverdue(std::chrono::steady_clock::now());
+  }
+  abandon(std::move(overdue), "no acknowledgement in time");
 }
 
 void NatsLink::onAcknowledged(jsCtx*, natsMsg* message, jsPubAck*, jsPubAckErr* error, void* link) {
-  static_cast<NatsLink*>(link)->resolve(NatsMessage(message), error);
+  NatsMessage owned(message);
+  auto& self = *static_cast<NatsLink*>(link);
+  if (error != nullptr && isTemporary(error->Err, error->ErrCode)) {
+    return self.hold(std::span(&owned, 1), natsStatus_GetText(error->Err));
+  }
+  self.resolve(std::move(owned), error);
 }
 
 void NatsLink::resolve(NatsMessage message, const jsPubAckErr* error) {
@@ -75,25 +165,27 @@ void NatsLink::resolve(NatsMessage message, const jsPubAckErr* error) {
     const MutexLock lock(mutex_);
     entry = pending_.take(message.get());
     message.reset();  // before the thread learns that nothing is outstanding, and ends the library
-    const bool isAwaited =
-        (isWindowFull_ && pending_.isHalfFree()) || (closeBy_ && pending_.size() == 0);
+    const bool isProbed = flow_ == Flow::kProbing;
+    if (isProbed) flow_ = Flow::kFlowing;
+    const bool isAwaited = isProbed || pending_.needsAgain() ||
+                           (isWindowFull_ && pending_.isHalfFree()) ||
+                           (closeBy_ && pending_.size() == 0);
     if (isAwaited) changed_.notifyAll();
   }
-  if (!entry) return;  // given up before
+  if (entry) settle(*entry, error);  // else given up before
+}
+
+void NatsLink::settle(const PendingAcks::Entry& entry, const jsPubAckErr* error) {
   if (error == nullptr) {
     acknowledged_.add();
   } else {
-    countFailure(1, natsStatus_GetText(error->Err));
-    if (error->Err == NATS_TIMEOUT) {
-      notAcknowledged_.add();
-    } else {
-      statistics_.counter(kNatsPiece, std::string("failed: ") + natsStatus_GetText(error->Err))
-          .add();
-    }
+    const std::string_view reason = natsStatus_GetText(error->Err);
+    countFailure(1, error->ErrText != nullptr ? error->ErrText : reason);
+    statistics_.counter(kNatsPiece, std::string("failed: ") + std::string(reason)).add();
   }
-  if (!entry->ledger) return;
-  entry->ledger->resolve(entry->number,
-                         error == nullptr ? AckOutcome::kAcknowledged : AckOutcome::kFailed);
+  if (!entry.ledger) return;
+  entry.ledger->resolve(entry.number,
+                        error == nullptr ? AckOutcome::kAcknowledged : AckOutcome::kFailed);
 }
 
 void NatsLink::countFailure(std::uint64_t messages, std::string_view reason) {
@@ -108,10 +200,10 @@ void NatsLink::countFailure(std::uint64_t messages, std::string_view reason) {
   }
 }
 
-void NatsLink::abandon(std::vector<PendingAcks::Entry> entries) {
+void NatsLink::abandon(std::vector<PendingAcks::Entry> entries, std::string_view reason) {
   if (entries.empty()) return;
   notAcknowledged_.add(entries.size());
-  countFailure(entries.size(), "the connection ended");
+  countFailure(entries.size(), reason);
   for (const PendingAcks::Entry& entry : entries) {
     if (entry.ledger) entry.ledger->resolve(entry.number, AckOutcome::kFailed);
   }

@@ -127,6 +127,7 @@ TLMReportingOutcome NatsTlmReportingService::TLMReportingSendOneMessage(
 
 TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
                                                   const TLMReportingMessage& message) {
+  if (auto ending = link_->refuseAtEnd()) return {.sent = false, .error = std::move(ending)};
   const std::string_view payload = encoder().encode(message.payload);
   std::string body;
   body.reserve(session.beginning().size() + payload.size() + 48);

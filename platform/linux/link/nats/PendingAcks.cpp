@@ -1,41 +1,77 @@
 #include "platform/linux/link/nats/PendingAcks.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace halvox::platform::linux_ {
 
-void PendingAcks::add(const void* message, Entry entry) {
-  entry.epoch = epoch_;
-  ++messages_;
-  bytes_ += entry.bytes;
-  entries_.insert_or_assign(message, std::move(entry));
+std::optional<PendingAcks::Time> PendingAcks::firstDeadline() const {
+  if (slots_.empty()) return std::nullopt;
+  return slots_.front().entry.deadline;
 }
 
-std::optional<PendingAcks::Entry> PendingAcks::take(const void* message) {
-  const auto found = entries_.find(message);
-  if (found == entries_.end()) return std::nullopt;
-  Entry entry = std::move(found->second);
-  entries_.erase(found);
-  if (entry.epoch == epoch_) {
-    --messages_;
-    bytes_ -= entry.bytes;
+void PendingAcks::add(const natsMsg* message, Entry entry) {
+  atLibrary_.insert_or_assign(message, first_ + slots_.size());
+  ++size_;
+  bytes_ += entry.bytes;
+  slots_.push_back({.entry = std::move(entry)});
+  again_ = first_ + slots_.size();
+}
+
+PendingAcks::Entry PendingAcks::settle(Slot& slot) {
+  --size_;
+  bytes_ -= slot.entry.bytes;
+  slot.isSettled = true;
+  slot.held.reset();
+  return std::move(slot.entry);
+}
+
+// Leaves unsettled ones at the front and at the next to be published again.
+void PendingAcks::skipSettled() {
+  while (!slots_.empty() && slots_.front().isSettled) {
+    slots_.pop_front();
+    ++first_;
   }
+  again_ = std::max(again_, first_);
+  while (needsAgain() && slots_[again_ - first_].isSettled) ++again_;
+}
+
+std::optional<PendingAcks::Entry> PendingAcks::take(const natsMsg* message) {
+  const auto found = atLibrary_.find(message);
+  if (found == atLibrary_.end()) return std::nullopt;
+  const std::uint64_t number = found->second;
+  atLibrary_.erase(found);
+  if (number < first_) return std::nullopt;
+  Entry entry = settle(slots_[number - first_]);
+  skipSettled();
   return entry;
 }
 
-std::vector<PendingAcks::Entry> PendingAcks::takeAll() {
-  std::vector<Entry> all;
-  all.reserve(entries_.size());
-  for (auto& [message, entry] : entries_) all.push_back(std::move(entry));
-  entries_.clear();
-  beginEpoch();
-  return all;
+bool PendingAcks::giveBack(NatsMessage message) {
+  const auto found = atLibrary_.find(message.get());
+  if (found == atLibrary_.end()) return false;
+  const std::uint64_t number = found->second;
+  atLibrary_.erase(found);
+  if (number < first_) return false;
+  slots_[number - first_].held = std::move(message);
+  return true;
 }
 
-void PendingAcks::beginEpoch() {
-  ++epoch_;
-  messages_ = 0;
-  bytes_ = 0;
+NatsMessage PendingAcks::nextAgain() {
+  NatsMessage message = std::move(slots_[again_ - first_].held);
+  atLibrary_.insert_or_assign(message.get(), again_);
+  ++again_;
+  skipSettled();
+  return message;
+}
+
+std::vector<PendingAcks::Entry> PendingAcks::takeOverdue(Time now) {
+  std::vector<Entry> overdue;
+  while (!slots_.empty() && slots_.front().entry.deadline <= now) {
+    overdue.push_back(settle(slots_.front()));
+    skipSettled();
+  }
+  return overdue;
 }
 
 }  // namespace halvox::platform::linux_

@@ -1,65 +1,134 @@
 #include "platform/linux/link/nats/PendingAcks.h"
 
-#include <array>
-
 #include <gtest/gtest.h>
 
 namespace halvox::platform::linux_ {
 namespace {
 
-PendingAcks::Entry entryOf(std::size_t bytes) {
-  return {.ledger = nullptr, .number = 0, .bytes = bytes, .epoch = 0};
+using Time = PendingAcks::Time;
+
+NatsMessage makeMessage() {
+  NatsMessage message;
+  EXPECT_EQ(natsMsg_Create(message.out(), "subject", nullptr, "x", 1), NATS_OK);
+  return message;
 }
 
-TEST(PendingAcksTest, WindowIsFullAtItsMessages) {
-  PendingAcks pending({.messages = 2, .bytes = 1000});
-  const std::array<char, 2> messages{};
+PendingAcks::Entry entryOf(std::size_t bytes, Time deadline = Time::max()) {
+  return {.ledger = nullptr, .number = 0, .bytes = bytes, .deadline = deadline};
+}
 
-  pending.add(&messages[0], entryOf(1));
+Time at(int seconds) { return Time(std::chrono::seconds(seconds)); }
+
+class PendingAcksTest : public ::testing::Test {
+ protected:
+  // Messages of the library need it to be open.
+  static void SetUpTestSuite() { ASSERT_EQ(nats_Open(-1), NATS_OK); }
+  static void TearDownTestSuite() { EXPECT_EQ(nats_CloseAndWait(5000), NATS_OK); }
+
+  // Adds it, as a message that the library has.
+  const natsMsg* add(NatsMessage& message, Time deadline = Time::max()) {
+    pending.add(message.get(), entryOf(1, deadline));
+    return message.get();
+  }
+
+  PendingAcks pending{{.messages = 2, .bytes = 1000}};
+  NatsMessage one = makeMessage();
+  NatsMessage two = makeMessage();
+  NatsMessage three = makeMessage();
+};
+
+TEST_F(PendingAcksTest, WindowIsFullAtItsMessages) {
+  add(one);
   EXPECT_TRUE(pending.hasRoom());
-  pending.add(&messages[1], entryOf(1));
+  add(two);
   EXPECT_FALSE(pending.hasRoom());
-  EXPECT_TRUE(pending.take(&messages[0]).has_value());
+  EXPECT_TRUE(pending.take(two.get()).has_value());
 
   EXPECT_TRUE(pending.hasRoom());
 }
 
-TEST(PendingAcksTest, WindowIsFullAtItsBytes) {
-  PendingAcks pending({.messages = 100, .bytes = 1000});
-  const char message = 0;
-
-  pending.add(&message, entryOf(5000));
+TEST_F(PendingAcksTest, WindowIsFullAtItsBytes) {
+  pending.add(one.get(), entryOf(5000));
 
   EXPECT_FALSE(pending.hasRoom());
 }
 
-TEST(PendingAcksTest, AMessageIsTakenOnce) {
-  PendingAcks pending({});
-  const char message = 0;
-  pending.add(&message, entryOf(7));
+TEST_F(PendingAcksTest, AMessageIsTakenOnce) {
+  pending.add(one.get(), entryOf(7));
 
-  EXPECT_EQ(pending.take(&message)->bytes, 7U);
-  EXPECT_FALSE(pending.take(&message).has_value());
+  EXPECT_EQ(pending.take(one.get())->bytes, 7U);
+  EXPECT_FALSE(pending.take(one.get()).has_value());
+  EXPECT_EQ(pending.size(), 0U);
 }
 
-TEST(PendingAcksTest, WhatABrokenConnectionLeftDoesNotFillTheWindow) {
-  PendingAcks pending({.messages = 1, .bytes = 1000});
-  const std::array<char, 2> messages{};
-  pending.add(&messages[0], entryOf(1));
+TEST_F(PendingAcksTest, WhatWasGivenBackIsPublishedAgainInTheFirstOrder) {
+  const natsMsg* const first = add(one);
+  const natsMsg* const second = add(two);
+  const natsMsg* const third = add(three);
+  EXPECT_FALSE(pending.needsAgain());
 
-  pending.beginEpoch();
-  EXPECT_TRUE(pending.hasRoom());
-  pending.add(&messages[1], entryOf(1));
-  EXPECT_TRUE(pending.take(&messages[0]).has_value());
+  EXPECT_TRUE(pending.giveBack(std::move(three)));
+  EXPECT_TRUE(pending.giveBack(std::move(one)));
+  EXPECT_TRUE(pending.take(second).has_value());
+  pending.beginAgain();
 
-  EXPECT_FALSE(pending.hasRoom());
-  EXPECT_EQ(pending.size(), 1U);
+  one = pending.nextAgain();
+  EXPECT_EQ(one.get(), first);
+  three = pending.nextAgain();
+  EXPECT_EQ(three.get(), third);
+  EXPECT_FALSE(pending.needsAgain());
+  EXPECT_TRUE(pending.take(third).has_value());
+  EXPECT_TRUE(pending.take(first).has_value());
 }
 
-TEST(PendingAcksTest, TakingAllLeavesAnEmptyWindow) {
-  PendingAcks pending({.messages = 1, .bytes = 1000});
-  const char message = 0;
-  pending.add(&message, entryOf(1));
+TEST_F(PendingAcksTest, WhatTheLibraryHasYetHoldsTheLaterOnesUp) {
+  add(one);
+  add(two);
+  EXPECT_TRUE(pending.giveBack(std::move(two)));
+
+  pending.beginAgain();
+  EXPECT_TRUE(pending.needsAgain());
+  EXPECT_FALSE(pending.hasAgain());
+  EXPECT_TRUE(pending.take(one.get()).has_value());
+
+  EXPECT_TRUE(pending.hasAgain());
+}
+
+TEST_F(PendingAcksTest, ASecondFailureBeginsAtTheOldestAgain) {
+  const natsMsg* const first = add(one);
+  add(two);
+  EXPECT_TRUE(pending.giveBack(std::move(one)));
+  EXPECT_TRUE(pending.giveBack(std::move(two)));
+  pending.beginAgain();
+  one = pending.nextAgain();
+
+  EXPECT_TRUE(pending.giveBack(std::move(one)));
+  pending.beginAgain();
+
+  one = pending.nextAgain();
+  EXPECT_EQ(one.get(), first);
+  EXPECT_TRUE(pending.hasAgain());
+}
+
+TEST_F(PendingAcksTest, WhatIsOverdueIsGivenUpWhereverItIs) {
+  add(one, at(1));
+  add(two, at(1));
+  const natsMsg* const third = add(three, at(3));
+  EXPECT_TRUE(pending.giveBack(std::move(one)));
+  EXPECT_EQ(pending.firstDeadline(), at(1));
+
+  EXPECT_EQ(pending.takeOverdue(at(2)).size(), 2U);
+
+  EXPECT_FALSE(pending.take(two.get()).has_value());
+  EXPECT_FALSE(pending.giveBack(std::move(two)));
+  EXPECT_TRUE(pending.take(third).has_value());
+  EXPECT_FALSE(pending.firstDeadline().has_value());
+}
+
+TEST_F(PendingAcksTest, TakingAllLeavesAnEmptyWindow) {
+  add(one);
+  add(two);
+  EXPECT_TRUE(pending.take(two.get()).has_value());
 
   EXPECT_EQ(pending.takeAll().size(), 1U);
 

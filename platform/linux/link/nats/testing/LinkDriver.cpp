@@ -8,8 +8,8 @@
 //   one SERVICE    sends a message outside any session: "sent 1 0", or "sent 0 1 ERROR"
 //   threads        "threads COUNT"
 //   acknowledged   "acknowledged COUNT", of all messages so far
-//   end            closes the back-end and prints its counters, "counted VALUE NAME", and the
-//                  lines of its log, "log LINE"; then "ended"
+//   end            closes the back-end, sends one message too late and prints the counters,
+//                  "counted VALUE NAME", and the lines of the log, "log LINE"; then "ended"
 #include <chrono>
 #include <condition_variable>
 #include <filesystem>
@@ -179,6 +179,8 @@ int drive(const Configuration& configuration) {
   }
   (void)dispatch.stop(std::chrono::seconds(5));
   link->close();
+  const TLMReportingOutcome late = link->TLMReportingSendOneMessage({}, {}, {4, 1, {}});
+  if (late.sent) std::cout << "log a message was taken after the end\n";
   for (const CounterReading& reading : statistics.snapshot()) {
     if (reading.piece == "link to NATS") {
       std::cout << "counted " << reading.value << " " << reading.name << "\n";
