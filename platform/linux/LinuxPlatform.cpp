@@ -154,6 +154,7 @@ LinuxPlatform::LinuxPlatform(const Configuration& configuration)
       preferences_(preferenceReader_, statistics_),
       ioReport_(makeDriverSources(configuration_.drivers), statistics_),
       resultsFiles_(configuration_.storage.root, statistics_),
+      traces_(makeTraceServices(configuration_.storage.directory, statistics_)),
       dispatch_(*log_, statistics_),
       nats_(configuration_.link.backend == LinkBackend::kNats
                 ? makeNatsTlmReporting(configuration_.link, {dispatch_, statistics_})
@@ -176,11 +177,11 @@ Services LinuxPlatform::services() {
           .files = files_,
           .ioReport = ioReport_,
           .kdebug = *kdebug_,
-          .ktrace = ktrace_,
+          .ktrace = traces_->ktrace(),
           .log = *log_,
           .metrics = metrics_,
           .notify = notify_,
-          .performanceTraces = performanceTraces_,
+          .performanceTraces = traces_->performanceTraces(),
           .powerLog = powerLog_,
           .preferences = preferences_,
           .process = process_,
@@ -198,6 +199,7 @@ std::optional<StartFailure> LinuxPlatform::open() {
     return StartFailure{exitStatus(error->kind), error->description};
   }
   diagnosticReporters_.removeLeftovers();
+  traces_->open();
   ioReport_.open();
   if (const auto error = connections_.open()) {
     return StartFailure{exitStatus(error->kind), error->description};
@@ -209,7 +211,9 @@ std::optional<StartFailure> LinuxPlatform::open() {
 bool LinuxPlatform::close() {
   diagnosticReporters_.stop();
   notify_.stop();  // it adds jobs to queues
+  traces_->stop();
   const bool ended = dispatch_.stop(kJobsEndWithin);
+  if (ended) traces_->close();
   if (nats_) nats_->close();
   store_.close();
   logStatistics(LogLevel::kInfo, Counters::kCounted);

@@ -4,7 +4,6 @@
 #include <optional>
 #include <string>
 
-#include "platform/fake/AbsentServices.h"
 #include "platform/linux/SqliteSnapshotRecorder.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
 #include "platform/linux/diagnostics/SnapshotDiagnosticReporterService.h"
@@ -32,6 +31,7 @@
 #include "platform/linux/store/SqliteStore.h"
 #include "platform/linux/tracing/JsonResultsFileService.h"
 #include "platform/linux/tracing/PlistPropertyListService.h"
+#include "platform/linux/tracing/TraceServices.h"
 #include "platform/services.h"
 
 namespace halvox::platform::linux_ {
@@ -94,10 +94,9 @@ class LinuxPlatform {
   LocalTlmReportingService localLink_{store_, clock_};
   NoneTlmReportingService noLink_{statistics_};
   LinuxIOReportService ioReport_;
-  AbsentKtrace ktrace_;
-  AbsentPerformanceTraces performanceTraces_;
   PlistPropertyListService propertyLists_;
   JsonResultsFileService resultsFiles_;
+  const std::unique_ptr<TraceServices> traces_;
   AsioDispatchService dispatch_;
   const std::unique_ptr<NatsTlmReporting> nats_;  // only when the link goes there
 };

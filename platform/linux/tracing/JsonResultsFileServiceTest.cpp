@@ -132,7 +132,9 @@ TEST_F(JsonResultsFileServiceTest, MissingDirectoryGivesNoWriter) {
   EXPECT_EQ(open("/missing/results.ssj"), nullptr);
 
   EXPECT_EQ(count("files that failed"), 1U);
-  EXPECT_TRUE(platform_.log.containsText("missing"));
+  const auto errors = platform_.log.texts(LogLevel::kError);
+  ASSERT_EQ(errors.size(), 1U);
+  EXPECT_NE(errors.front().find("/missing"), std::string::npos) << errors.front();
 }
 
 TEST_F(JsonResultsFileServiceTest, LinkThatLeadsOutOfTheRootGivesNoWriter) {

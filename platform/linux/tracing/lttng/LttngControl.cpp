@@ -1,0 +1,186 @@
+#include "platform/linux/tracing/lttng/LttngControl.h"
+
+#include <algorithm>
+#include <bit>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <system_error>
+#include <utility>
+
+#include <lttng/lttng.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "platform/linux/UniqueHandle.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using Handle = UniqueHandle<lttng_handle*, lttng_destroy_handle>;
+using Channel = UniqueHandle<lttng_channel*, lttng_channel_destroy>;
+using Event = UniqueHandle<lttng_event*, lttng_event_destroy>;
+
+constexpr const char* kChannel = "halvox";
+// For each processor: holds 200,000 events a second for the second that the consumer may be late.
+constexpr std::uint64_t kSubBufferBytes = 1U << 20U;
+constexpr std::uint64_t kMostSubBuffers = 16;
+constexpr std::uint64_t kFewestSubBuffers = 4;
+constexpr std::uint64_t kMostBytesOfAll = 256U << 20U;
+
+// The tracer takes memory for every processor that the machine may have.
+std::uint64_t subBuffers() {
+  const auto processors = static_cast<std::uint64_t>(std::max(1L, ::sysconf(_SC_NPROCESSORS_CONF)));
+  const std::uint64_t share = kMostBytesOfAll / kSubBufferBytes / processors;
+  return std::bit_floor(std::clamp(share, kFewestSubBuffers, kMostSubBuffers));
+}
+
+lttng_domain domain() {
+  lttng_domain result{};
+  result.type = LTTNG_DOMAIN_UST;
+  result.buf_type = LTTNG_BUFFER_PER_UID;
+  return result;
+}
+
+// `result` is one of the library's codes, negative for an error.
+LttngControl::Failure check(int result, std::string_view what) {
+  if (result >= 0) return std::nullopt;
+  return "cannot " + std::string(what) + ": " + ::lttng_strerror(result);
+}
+
+void copyName(std::span<char> to, std::string_view from) {
+  const std::size_t length = std::min(from.size(), to.size() - 1);
+  std::ranges::copy(from.substr(0, length), to.begin());
+  to[length] = '\0';
+}
+
+LttngControl::Failure addChannel(lttng_handle* handle) {
+  lttng_domain ust = domain();
+  const Channel channel(::lttng_channel_create(&ust));
+  if (!channel) return "cannot make a channel";
+  copyName(channel.get()->name, kChannel);
+  channel.get()->attr.overwrite = 0;
+  channel.get()->attr.subbuf_size = kSubBufferBytes;
+  channel.get()->attr.num_subbuf = subBuffers();
+  return check(::lttng_enable_channel(handle, channel.get()), "enable the channel");
+}
+
+LttngControl::Failure addContexts(lttng_handle* handle) {
+  for (const auto context :
+       {LTTNG_EVENT_CONTEXT_VPID, LTTNG_EVENT_CONTEXT_VTID, LTTNG_EVENT_CONTEXT_PROCNAME}) {
+    lttng_event_context added{};
+    added.ctx = context;
+    const int result = ::lttng_add_context(handle, &added, nullptr, kChannel);
+    if (auto failure = check(result, "add a context")) return failure;
+  }
+  return std::nullopt;
+}
+
+LttngControl::Failure addEvent(lttng_handle* handle, RecordingPlan plan) {
+  const Event event(::lttng_event_create());
+  if (!event) return "cannot make an event";
+  event.get()->type = LTTNG_EVENT_TRACEPOINT;
+  event.get()->loglevel_type = LTTNG_EVENT_LOGLEVEL_ALL;
+  copyName(event.get()->name, plan.event);
+  std::vector<char*> exclusions;
+  for (std::string& exclusion : plan.exclusions) exclusions.push_back(exclusion.data());
+  const int result = ::lttng_enable_event_with_exclusions(
+      handle, event.get(), kChannel, plan.filter.empty() ? nullptr : plan.filter.c_str(),
+      static_cast<int>(exclusions.size()), exclusions.empty() ? nullptr : exclusions.data());
+  return check(result, "enable the event");
+}
+
+}  // namespace
+
+LttngControl::LttngControl(std::filesystem::path tracesDirectory)
+    : tracesDirectory_(std::move(tracesDirectory)),
+      scratchDirectory_(tracesDirectory_ / "scratch"),
+      daemon_(tracesDirectory_ / "lttng-sessiond") {}
+
+std::string LttngControl::namePrefix() const {
+  struct stat status {};
+  ::stat(tracesDirectory_.c_str(), &status);
+  return "halvox-" + std::to_string(status.st_dev) + "-" + std::to_string(status.st_ino) + "-";
+}
+
+std::vector<std::string> LttngControl::sessionNames() {
+  lttng_session* sessions = nullptr;
+  const int count = ::lttng_list_sessions(&sessions);
+  const std::unique_ptr<lttng_session, decltype(&std::free)> owner(sessions, &std::free);
+  std::vector<std::string> names;
+  for (int index = 0; index < count; ++index) names.emplace_back(sessions[index].name);
+  return names;
+}
+
+void LttngControl::destroyOurSessions() {
+  const std::string prefix = namePrefix();
+  for (const std::string& name : sessionNames()) {
+    if (name.starts_with(prefix)) static_cast<void>(::lttng_destroy_session_no_wait(name.c_str()));
+  }
+}
+
+void LttngControl::removeLeftovers() {
+  const MutexLock lock(mutex_);
+  std::error_code ignored;
+  const bool isRecorded = std::filesystem::exists(scratchDirectory_, ignored);
+  if (!isRecorded && !daemon_.isNoted()) return;
+  daemon_.adopt();
+  if (::lttng_session_daemon_alive() == 1) destroyOurSessions();
+  std::filesystem::remove_all(scratchDirectory_, ignored);
+}
+
+LttngControl::Failure LttngControl::begin(const RecordingPlan& plan, Recording& recording) {
+  const MutexLock lock(mutex_);
+  std::error_code error;
+  std::filesystem::create_directories(tracesDirectory_, error);
+  recording.name = namePrefix() + std::to_string(::getpid()) + "-" + std::to_string(++begun_);
+  recording.directory = scratchDirectory_ / recording.name;
+  std::filesystem::create_directories(recording.directory, error);
+  if (error) return "cannot make " + recording.directory.string() + ": " + error.message();
+  if (::lttng_session_daemon_alive() != 1) {
+    if (auto failure = daemon_.start()) return failure;
+  }
+  return setUp(plan, recording);
+}
+
+LttngControl::Failure LttngControl::setUp(const RecordingPlan& plan, const Recording& recording) {
+  const std::string url = "file://" + recording.directory.string();
+  const char* const name = recording.name.c_str();
+  if (auto failure = check(::lttng_create_session(name, url.c_str()), "create a session")) {
+    return failure;
+  }
+  lttng_domain ust = domain();
+  const Handle handle(::lttng_create_handle(name, &ust));
+  Failure failure = handle ? addChannel(handle.get()) : Failure("cannot make a handle");
+  if (!failure) failure = addContexts(handle.get());
+  if (!failure) failure = addEvent(handle.get(), plan);
+  if (!failure) failure = check(::lttng_start_tracing(name), "start the session");
+  if (failure) static_cast<void>(::lttng_destroy_session_no_wait(name));
+  return failure;
+}
+
+LttngControl::Failure LttngControl::end(const Recording& recording) {
+  const MutexLock lock(mutex_);
+  const char* const name = recording.name.c_str();
+  // Both wait until what was recorded is on the disk.
+  Failure failure = check(::lttng_stop_tracing(name), "stop the session");
+  Failure other = check(::lttng_destroy_session(name), "destroy the session");
+  return failure ? failure : other;
+}
+
+void LttngControl::discard(const Recording& recording) {
+  std::error_code ignored;
+  if (!recording.directory.empty()) std::filesystem::remove_all(recording.directory, ignored);
+}
+
+void LttngControl::close() {
+  const MutexLock lock(mutex_);
+  if (begun_ == 0 && !daemon_.isOurs()) return;
+  const bool isAlive = ::lttng_session_daemon_alive() == 1;
+  if (isAlive) destroyOurSessions();
+  std::error_code ignored;
+  std::filesystem::remove_all(scratchDirectory_, ignored);
+  if (!isAlive || sessionNames().empty()) daemon_.end();
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,217 @@
+#include "platform/linux/tracing/lttng/LttngKtraceService.h"
+
+#include <memory>
+#include <utility>
+#include <vector>
+
+#include "platform/linux/tracing/TracingLog.h"
+#include "platform/linux/tracing/lttng/TraceReader.h"
+#include "platform/services.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog(tracingCategory, "LttngKtraceService");
+
+constexpr int kNotStarted = 1;
+constexpr int kNoRange = 2;
+constexpr std::size_t kBatchEvents = 4096;
+
+using Batch = std::vector<trace_point>;
+
+struct Range {
+  std::uint32_t low = 0;
+  std::uint32_t high = 0;
+  KtraceService::EventHandler handler{};
+};
+
+}  // namespace
+
+// Belongs to its caller until it is ended, then to the thread that reads, then, batch by batch, to
+// the queue that it was started with.
+class LttngKtraceSession final : public KtraceSession {
+ public:
+  std::vector<Range> ranges;
+  std::function<void()> completion;
+  std::shared_ptr<DispatchQueue> queue;
+  std::optional<LttngControl::Recording> recording;  // while it records
+  TraceClock clock;
+  bool hasWalltimes = false;
+  bool isEnded = false;
+
+  [[nodiscard]] std::string filter() const {
+    std::string text;
+    for (const Range& range : ranges) {
+      text += text.empty() ? "" : " || ";
+      text += "(code >= " + std::to_string(range.low) + " && code <= " + std::to_string(range.high);
+      text += ")";
+    }
+    return text;
+  }
+
+  void deliver(const Batch& batch) const {
+    for (const trace_point& point : batch) {
+      for (const Range& range : ranges) {
+        const bool isWanted = point.debugid >= range.low && point.debugid <= range.high;
+        if (isWanted && range.handler) range.handler(point);
+      }
+    }
+  }
+};
+
+namespace {
+
+std::shared_ptr<LttngKtraceSession> own(const KtraceService::Session& session) {
+  return std::dynamic_pointer_cast<LttngKtraceSession>(session);
+}
+
+}  // namespace
+
+bool DeliveryGate::enter() {
+  const MutexLock lock(mutex_);
+  while (inside_ == most_ && !isStopping_) changed_.wait(mutex_);
+  if (isStopping_) return false;
+  ++inside_;
+  return true;
+}
+
+void DeliveryGate::leave() {
+  const MutexLock lock(mutex_);
+  --inside_;
+  changed_.notifyAll();
+}
+
+void DeliveryGate::stop() {
+  const MutexLock lock(mutex_);
+  isStopping_ = true;
+  changed_.notifyAll();
+}
+
+LttngKtraceService::LttngKtraceService(LttngControl& control, StatisticsService& statistics)
+    : control_(control),
+      started_(statistics.counter("kernel traces", "traces started")),
+      failed_(statistics.counter("kernel traces", "traces that failed")),
+      delivered_(statistics.counter("kernel traces", "events delivered")),
+      lost_(statistics.counter("kernel traces", "events lost by the tracer")) {}
+
+void LttngKtraceService::stop() { gate_.stop(); }
+
+void LttngKtraceService::close() {
+  const MutexLock lock(mutex_);
+  readingQueue_.reset();
+}
+
+std::shared_ptr<DispatchQueue> LttngKtraceService::readingQueue() {
+  const MutexLock lock(mutex_);
+  if (readingQueue_ == nullptr) {
+    readingQueue_ = platform::dispatch().createSerialQueue(
+        "Trace Reading", QualityOfService::kUtility, QueueThreading::kOwnThread);
+  }
+  return readingQueue_;
+}
+
+KtraceService::Session LttngKtraceService::ktrace_session_create() {
+  return std::make_shared<LttngKtraceSession>();
+}
+
+void LttngKtraceService::ktrace_set_completion_handler(const Session& session,
+                                                       std::function<void()> handler) {
+  own(session)->completion = std::move(handler);
+}
+
+void LttngKtraceService::ktrace_set_walltimes_enabled(const Session& session, bool enabled) {
+  own(session)->hasWalltimes = enabled;
+}
+
+int LttngKtraceService::ktrace_events_range(const Session& session, std::uint32_t low,
+                                            std::uint32_t high, EventHandler handler) {
+  if (low > high) return kNoRange;
+  own(session)->ranges.push_back({low, high, std::move(handler)});
+  return 0;
+}
+
+int LttngKtraceService::ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) {
+  const auto ours = own(session);
+  ours->queue = std::move(queue);
+  started_.add();
+  if (ours->ranges.empty()) return 0;
+  LttngControl::Recording recording;
+  const RecordingPlan plan{.event = "halvox:kdebug", .filter = ours->filter()};
+  if (const auto failure = control_.begin(plan, recording)) {
+    failed_.add();
+    control_.discard(recording);
+    kLog.error("no kernel trace: ", *failure);
+    return kNotStarted;
+  }
+  ours->recording = std::move(recording);
+  return 0;
+}
+
+void LttngKtraceService::ktrace_end(const Session& session, int /*reason*/) {
+  auto ours = own(session);
+  if (std::exchange(ours->isEnded, true)) return;
+  readingQueue()->async(JobWeight::kMayBlock, [this, ours = std::move(ours)] { finish(ours); });
+}
+
+// On the service's thread.
+void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& session) {
+  if (session->recording.has_value()) {
+    if (const auto failure = control_.end(*session->recording)) {
+      failed_.add();
+      kLog.error("kernel trace incomplete: ", *failure);
+    }
+    deliverAll(session);
+    control_.discard(*session->recording);
+  }
+  if (session->queue == nullptr) return;
+  session->queue->async(JobWeight::kMayBlock, [session] {
+    if (session->completion) session->completion();
+  });
+}
+
+void LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& session) {
+  auto batch = std::make_shared<Batch>();
+  const auto deliver = [&] {
+    if (batch->empty()) return;
+    if (!gate_.enter()) return batch->clear();
+    delivered_.add(batch->size());
+    auto full = std::exchange(batch, std::make_shared<Batch>());
+    batch->reserve(kBatchEvents);
+    session->queue->async(JobWeight::kMayBlock, [this, session, full = std::move(full)] {
+      session->deliver(*full);
+      gate_.leave();
+    });
+  };
+  const TraceReading reading =
+      readTraces(session->recording->directory,
+                 {.onClock = [&](const TraceClock& clock) { session->clock = clock; },
+                  .onEvent =
+                      [&](const trace_point& point) {
+                        batch->push_back(point);
+                        if (!session->hasWalltimes) batch->back().walltime = 0;
+                        if (batch->size() == kBatchEvents) deliver();
+                      }});
+  deliver();
+  lost_.add(reading.lost);
+  if (reading.failure) kLog.error("kernel trace cannot be read back: ", *reading.failure);
+  if (reading.lost + reading.lostPackets == 0) return;
+  kLog.error("kernel trace lost ", reading.lost, " events and ", reading.lostPackets, " packets");
+}
+
+void LttngKtraceService::ktrace_session_destroy(const Session& session) {
+  const auto ours = own(session);
+  if (!ours->isEnded && ours->recording.has_value()) {
+    ours->isEnded = true;
+    static_cast<void>(control_.end(*ours->recording));
+    control_.discard(*ours->recording);
+  }
+  // The handlers may refer to who made the session.
+  ours->ranges.clear();
+}
+
+std::uint64_t LttngKtraceService::ktrace_convert_timestamp_to_nanoseconds(
+    const Session& session, std::uint64_t timestamp) const {
+  return own(session)->clock.toNanoseconds(timestamp);
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,196 @@
+#include "platform/linux/tracing/lttng/LttngPerformanceTraceService.h"
+
+#include <algorithm>
+#include <array>
+#include <ctime>
+#include <optional>
+#include <string>
+#include <system_error>
+#include <utility>
+#include <vector>
+
+#include "platform/linux/tracing/TracingLog.h"
+#include "platform/linux/tracing/lttng/TraceArchive.h"
+#include "platform/services.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog(tracingCategory, "LttngPerformanceTraceService");
+
+constexpr std::size_t kKeptTraces = 20;
+constexpr const char* kTraceStart = "trace-";
+constexpr const char* kTraceEnd = ".tar.zst";
+
+struct TemplateConfig final : KQTraceConfig {
+  explicit TemplateConfig(std::int32_t templateNumber) : number(templateNumber) {}
+  const std::int32_t number;
+};
+
+Error traceError(std::string description) {
+  return {.domain = "com.tarno.halvox.tracing", .code = 1, .description = std::move(description)};
+}
+
+std::string timeText() {
+  const std::time_t now = std::time(nullptr);
+  std::tm utc{};
+  ::gmtime_r(&now, &utc);
+  std::array<char, 32> text{};
+  const std::size_t length = std::strftime(text.data(), text.size(), "%Y%m%dT%H%M%SZ", &utc);
+  return {text.data(), length};
+}
+
+// The names begin with the time, so the oldest comes first.
+void removeOldTraces(const std::filesystem::path& directory) {
+  std::vector<std::filesystem::path> traces;
+  std::error_code error;
+  for (const auto& entry : std::filesystem::directory_iterator(directory, error)) {
+    const std::string name = entry.path().filename().string();
+    if (name.starts_with(kTraceStart) && name.ends_with(kTraceEnd)) traces.push_back(entry.path());
+  }
+  if (traces.size() <= kKeptTraces) return;
+  std::ranges::sort(traces);
+  traces.resize(traces.size() - kKeptTraces);
+  for (const auto& trace : traces) std::filesystem::remove(trace, error);
+}
+
+}  // namespace
+
+// What the service and its sessions do, always on the service's thread.
+struct LttngPerformanceTraceService::Work {
+  LttngControl& control;
+  Counter& started;
+  Counter& failed;
+  Counter& saved;
+  std::uint64_t saves = 0;
+
+  std::optional<Error> begin(std::optional<LttngControl::Recording>& recording) {
+    started.add();
+    LttngControl::Recording begun;
+    // What the tracer tells of loaded libraries is none of a program's own events.
+    const RecordingPlan plan{.event = "*", .filter = {}, .exclusions = {"lttng_ust_*"}};
+    if (auto failure = control.begin(plan, begun)) {
+      failed.add();
+      control.discard(begun);
+      return traceError(std::move(*failure));
+    }
+    recording = std::move(begun);
+    return std::nullopt;
+  }
+
+  std::optional<Error> end(const LttngControl::Recording& recording) {
+    auto failure = control.end(recording);
+    if (!failure) return std::nullopt;
+    return traceError(std::move(*failure));
+  }
+
+  // Sets the trace's URL, or tells why there is none.
+  std::optional<Error> save(const LttngControl::Recording& recording, std::string& url) {
+    const std::string name = kTraceStart + timeText() + "-" + std::to_string(++saves) + kTraceEnd;
+    const std::filesystem::path archive = control.tracesDirectory() / name;
+    auto failure = packDirectory(recording.directory, archive);
+    (failure ? failed : saved).add();
+    if (failure) return traceError("cannot save the trace: " + *failure);
+    removeOldTraces(control.tracesDirectory());
+    url = "file://" + archive.string();
+    return std::nullopt;
+  }
+};
+
+namespace {
+
+using Work = LttngPerformanceTraceService::Work;
+
+class LttngTraceSession final : public KQTraceSession,
+                                public std::enable_shared_from_this<LttngTraceSession> {
+ public:
+  LttngTraceSession(std::shared_ptr<Work> work, std::shared_ptr<DispatchQueue> queue)
+      : work_(std::move(work)), queue_(std::move(queue)) {}
+  LttngTraceSession(const LttngTraceSession&) = delete;
+  LttngTraceSession& operator=(const LttngTraceSession&) = delete;
+  ~LttngTraceSession() override {
+    if (!recording_.has_value()) return;
+    queue_->async(JobWeight::kMayBlock, [work = work_, recording = std::move(*recording_)] {
+      static_cast<void>(work->end(recording));
+      work->control.discard(recording);
+    });
+  }
+
+  void setDelegate(std::weak_ptr<KQTraceSessionDelegate> delegate) override {
+    const MutexLock lock(mutex_);
+    delegate_ = std::move(delegate);
+  }
+  void startKQTrace() override {
+    queue_->async(JobWeight::kMayBlock, [self = shared_from_this()] { self->start(); });
+  }
+  void stopKQTrace() override {
+    queue_->async(JobWeight::kMayBlock, [self = shared_from_this()] { self->stop(); });
+  }
+
+ private:
+  std::shared_ptr<KQTraceSessionDelegate> delegate() {
+    const MutexLock lock(mutex_);
+    return delegate_.lock();
+  }
+
+  void start() {
+    if (recording_.has_value()) return;
+    const auto error = work_->begin(recording_);
+    if (const auto listener = delegate()) listener->kqTraceDidStart(error);
+  }
+
+  void stop() {
+    if (!recording_.has_value()) return;
+    const LttngControl::Recording recording = *std::exchange(recording_, std::nullopt);
+    auto error = work_->end(recording);
+    if (const auto listener = delegate()) listener->kqTraceDidStop(error);
+    std::string url;
+    const auto saveError = work_->save(recording, url);
+    work_->control.discard(recording);
+    if (!error) error = saveError;
+    if (error) kLog.error("performance trace failed: ", error->description);
+    if (const auto listener = delegate()) listener->kqTraceDidComplete(url, 0, error);
+  }
+
+  const std::shared_ptr<Work> work_;
+  const std::shared_ptr<DispatchQueue> queue_;
+  std::optional<LttngControl::Recording> recording_;  // touched on the queue alone
+  Mutex mutex_;
+  std::weak_ptr<KQTraceSessionDelegate> delegate_ HALVOX_GUARDED_BY(mutex_);
+};
+
+}  // namespace
+
+LttngPerformanceTraceService::LttngPerformanceTraceService(LttngControl& control,
+                                                           StatisticsService& statistics)
+    : work_(std::make_shared<Work>(
+          Work{.control = control,
+               .started = statistics.counter("performance traces", "traces started"),
+               .failed = statistics.counter("performance traces", "traces that failed"),
+               .saved = statistics.counter("performance traces", "traces saved")})) {}
+
+void LttngPerformanceTraceService::close() {
+  const MutexLock lock(mutex_);
+  queue_.reset();
+}
+
+std::shared_ptr<DispatchQueue> LttngPerformanceTraceService::queue() {
+  const MutexLock lock(mutex_);
+  if (queue_ == nullptr) {
+    queue_ = platform::dispatch().createSerialQueue("Performance Trace", QualityOfService::kUtility,
+                                                    QueueThreading::kOwnThread);
+  }
+  return queue_;
+}
+
+std::shared_ptr<KQTraceConfig> LttngPerformanceTraceService::configWithTemplate(
+    std::int32_t number) {
+  return std::make_shared<TemplateConfig>(number);
+}
+
+std::shared_ptr<KQTraceSession> LttngPerformanceTraceService::initWithConfig(
+    std::shared_ptr<KQTraceConfig> /*configuration*/) {
+  return std::make_shared<LttngTraceSession>(work_, queue());
+}
+
+}  // namespace halvox::platform::linux_

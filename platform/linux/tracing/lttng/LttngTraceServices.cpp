@@ -1,0 +1,40 @@
+#include "platform/linux/tracing/TraceServices.h"
+#include "platform/linux/tracing/lttng/LttngControl.h"
+#include "platform/linux/tracing/lttng/LttngKtraceService.h"
+#include "platform/linux/tracing/lttng/LttngPerformanceTraceService.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+class LttngTraceServices final : public TraceServices {
+ public:
+  LttngTraceServices(const std::filesystem::path& storageDirectory, StatisticsService& statistics)
+      : control_(storageDirectory / "traces"),
+        ktrace_(control_, statistics),
+        performanceTraces_(control_, statistics) {}
+
+  KtraceService& ktrace() override { return ktrace_; }
+  PerformanceTraceService& performanceTraces() override { return performanceTraces_; }
+  void open() override { control_.removeLeftovers(); }
+  void stop() override { ktrace_.stop(); }
+  void close() override {
+    control_.close();
+    ktrace_.close();
+    performanceTraces_.close();
+  }
+  [[nodiscard]] std::string description() const override { return "LTTng"; }
+
+ private:
+  LttngControl control_;
+  LttngKtraceService ktrace_;
+  LttngPerformanceTraceService performanceTraces_;
+};
+
+}  // namespace
+
+std::unique_ptr<TraceServices> makeTraceServices(const std::filesystem::path& storageDirectory,
+                                                 StatisticsService& statistics) {
+  return std::make_unique<LttngTraceServices>(storageDirectory, statistics);
+}
+
+}  // namespace halvox::platform::linux_
