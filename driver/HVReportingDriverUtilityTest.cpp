@@ -1,5 +1,6 @@
 #include "driver/HVReportingDriverUtility.h"
 
+#include <algorithm>
 #include <memory>
 #include <string>
 #include <vector>
@@ -343,6 +344,32 @@ TEST_F(HVReportingDriverUtilityTest, FormatsThatAreNotReportedAreLoggedAndSkippe
             Texts{"The IOReportingFormat 5 is not supported group : Speaker subgroup : (null)"});
   ASSERT_EQ(recorded().size(), 1U);
   EXPECT_TRUE(recorded()[0].contains("Amp_Speaker_Simple_a"));
+}
+
+TEST_F(HVReportingDriverUtilityTest, EachMessageGoesToTheSessionThenToAnalytics) {
+  Channel state = simpleChannel("s", 0);
+  state.format = IOReportFormat::kState;
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1), state});
+  const auto utility = makeUtility();
+  session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.analytics.wantOnly({"com.tarno.halvox.IOReporting.Simple"});
+  forgetWhatHappened();
+
+  utility.sendDriverLogsForSession(session_);
+
+  const Texts all = platform_.journal.texts();
+  const std::string sending = "sending message for session owned by 7";
+  const auto first = std::ranges::find(all, sending);
+  const auto simple = std::find(first, all.end(), "com.tarno.halvox.IOReporting.Simple");
+  const auto second = std::find(simple, all.end(), sending);
+  EXPECT_NE(std::find(second, all.end(), "com.tarno.halvox.IOReporting.State"), all.end());
+  EXPECT_EQ(std::count(first, all.end(), sending), 2);
+}
+
+TEST_F(HVReportingDriverUtilityTest, LinesGoUnderTheUtilitysName) {
+  const HVReportingDriverUtility utility;
+
+  EXPECT_EQ(platform_.log.lines().at(0).line.substr(0, 26), " HVReportingDriverUtility:");
 }
 
 }  // namespace

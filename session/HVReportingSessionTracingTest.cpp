@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <memory>
 #include <string>
 #include <vector>
@@ -265,6 +266,61 @@ TEST_F(HVReportingSessionTracingTest, BackEndIsChosenAgainAtTheStop) {
 
   EXPECT_TRUE(operations().empty());
   EXPECT_FALSE(session_->startedTracing());
+}
+
+// --- Hooks --------------------------------------------------------------------------------------
+
+TEST_F(HVReportingSessionTracingTest, FeatureSwitchedOffMeanwhileLeavesTheTraceAlone) {
+  session_->start();
+  platform_.featureFlags.set("Acoustat", "Tracing", platform::FakeFeatureFlagService::State::kOff);
+  forgetWhatHappened();
+
+  session_->stop();
+
+  EXPECT_TRUE(operations().empty());
+  EXPECT_TRUE(session_->startedTracing());
+}
+
+TEST_F(HVReportingSessionTracingTest, SessionThatIsNoTestAnyMoreLeavesTheTraceAlone) {
+  session_->start();
+  session_->setServiceType(AudioServiceType::kHaptics);
+  forgetWhatHappened();
+
+  session_->stop();
+
+  EXPECT_TRUE(operations().empty());
+  EXPECT_TRUE(session_->startedTracing());
+}
+
+TEST_F(HVReportingSessionTracingTest, NextRunDoesNotTraceAgainWhatIsStillTraced) {
+  session_->start();
+  session_->setServiceType(AudioServiceType::kHaptics);
+  session_->stop();
+  session_->setServiceType(AudioServiceType::kTest);
+  forgetWhatHappened();
+
+  session_->start();
+
+  EXPECT_TRUE(operations().empty());
+}
+
+TEST_F(HVReportingSessionTracingTest, StopWaitsForTheTraceBehindTheLinkBeforeTheRunEnds) {
+  session_->setTlmReportingEnabled(true);
+  session_->start();
+  session_->sendMessage(Dictionary{{"a", 1}}, AudioEventCategory::kPlayback, AudioEventType::kStart,
+                        nullptr);
+  forgetWhatHappened();
+
+  EXPECT_THROW(session_->stop(), std::logic_error);  // stands still in the wait
+
+  const Texts all = platform_.journal.texts();
+  const auto summary = std::ranges::find(all, "sending summary event for reporter 7");
+  EXPECT_NE(std::find(summary, all.end(), "trace stop"), all.end());
+  // The link's last job was added before the wait, in which the fake lets it run.
+  EXPECT_NE(std::ranges::find(all, "entering tlmreporting -[HVReportingSession stop]_block_invoke"),
+            all.end());
+  EXPECT_TRUE(session_->started());
+  EXPECT_TRUE(session_->nestedAggregatedPayloadData()->has_value());
 }
 
 }  // namespace

@@ -183,12 +183,16 @@ class Settings(unittest.TestCase):
     def test_a_notify_directory_that_is_deleted_and_made_again(self):
         client = self.client()
         client.create(101)
-        for _ in range(3):
+        for round_ in range(3):
             mark = self.mark()
             self.ctl("notify", NOTIFICATION)
             self.wait_for_change(mark)
+            if round_ > 0:
+                self.assertIn("the notify directory is there again: ", self.log_since(mark))
             mark = self.mark()
             shutil.rmtree(self.notify)
+            wait_for("the loss to be told",
+                     lambda: "the notify directory is gone, waiting for it: " in self.log_since(mark))
             self.assertEqual(client.valid(101)["reporterID"], 101)
             self.assertNotRegex(self.log_since(mark), r"feature \d+ changes")
 

@@ -34,10 +34,11 @@ std::vector<std::filesystem::path> normal(std::vector<std::filesystem::path> pat
 }  // namespace
 
 DirectoryWatch::DirectoryWatch(std::vector<std::filesystem::path> directories)
-    : directories_(normal(std::move(directories))) {}
+    : directories_(normal(std::move(directories))), isThere_(directories_.size(), false) {}
 
 std::error_code DirectoryWatch::arm() {
   watches_.clear();
+  isThere_.assign(directories_.size(), false);
   inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (!inotify_) return lastError();
   std::error_code first;
@@ -80,7 +81,10 @@ std::error_code DirectoryWatch::watchWay(std::size_t directory) {
     // One on the way that may be passed but not read is not watched, and taken to stay.
     if (error == std::errc::permission_denied && !isTarget) error.clear();
     if (error) return error;
-    if (isTarget) watch->directories.push_back(directory);
+    if (isTarget) {
+      watch->directories.push_back(directory);
+      isThere_[directory] = true;
+    }
     parent = path;
   }
   return {};

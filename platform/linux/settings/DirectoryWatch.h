@@ -36,6 +36,11 @@ class DirectoryWatch {
   // Begins anew. What happened before, also unnoticed, is for the caller to find out afterwards.
   // Gives the reason when a directory cannot be watched though it is there.
   [[nodiscard]] std::error_code arm();
+  // Whether that directory was there at the last arm().
+  [[nodiscard]] bool isThere(std::size_t directory) const { return isThere_[directory]; }
+  [[nodiscard]] const std::filesystem::path& path(std::size_t directory) const {
+    return directories_[directory];
+  }
   // Readable when something has happened; -1 before the first arm().
   [[nodiscard]] int descriptor() const { return inotify_.get(); }
   // Tells of each file that was written, touched, created, moved or deleted since the last call.
@@ -54,6 +59,7 @@ class DirectoryWatch {
   const std::vector<std::filesystem::path> directories_;
   UniqueFd inotify_;
   std::map<int, Watch> watches_;
+  std::vector<bool> isThere_;  // by directory
 };
 
 }  // namespace halvox::platform::linux_

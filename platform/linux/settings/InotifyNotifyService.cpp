@@ -141,8 +141,23 @@ void InotifyNotifyService::arm() {
   } else if (wasFailing) {
     kLog.notice("changed settings are noticed again");
   }
+  tellOfNotifyDirectory();
   settings_.noteEverything();
   noteNews();
+}
+
+// Whoever deletes the directory should read in the log why nothing is heard any more, and of its
+// return. One that has not been made yet is nothing to tell.
+void InotifyNotifyService::tellOfNotifyDirectory() {
+  const bool isThere = watch_.isThere(kNotifyDirectory);
+  if (isThere == std::exchange(hasNotifyDirectory_, isThere)) return;
+  if (!isThere) {
+    kLog.notice("the notify directory is gone, waiting for it: ",
+                watch_.path(kNotifyDirectory).native());
+    notifyDirectoryWasGone_ = true;
+  } else if (notifyDirectoryWasGone_) {
+    kLog.notice("the notify directory is there again: ", watch_.path(kNotifyDirectory).native());
+  }
 }
 
 void InotifyNotifyService::readChanges() {

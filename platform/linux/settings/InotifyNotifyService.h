@@ -60,12 +60,15 @@ class InotifyNotifyService final : public NotifyService {
   void run();
   [[nodiscard]] bool adoptRegistrations() HALVOX_EXCLUDES(mutex_);
   void arm();
+  void tellOfNotifyDirectory();
   void readChanges();
   void noteNews();
   void deliver();
   [[nodiscard]] std::optional<Clock::time_point> nextWork() const;
 
   DirectoryWatch watch_;
+  bool hasNotifyDirectory_ = false;
+  bool notifyDirectoryWasGone_ = false;
   WatchedSettings settings_;
   std::vector<Registration> registrations_;
   std::optional<Clock::time_point> retryAt_;    // when watching is tried again
