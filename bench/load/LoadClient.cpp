@@ -113,6 +113,14 @@ void LoadClient::call(const char* member, std::int64_t argument) {
   sd_bus_message_unref(reply);
 }
 
+double LoadClient::ask() {
+  const auto begin = std::chrono::steady_clock::now();
+  call("reporterIDValid", reporter_);
+  return std::chrono::duration<double>(std::chrono::steady_clock::now() - begin).count();
+}
+
+void LoadClient::stop() { call("stopReportingSessionForID", reporter_); }
+
 void LoadClient::createSessions(std::int64_t first, std::int64_t count) {
   for (std::int64_t id = first; id < first + count; ++id) call("createReportingSession", id);
 }

@@ -32,6 +32,10 @@ class LoadClient {
   void pipeline(std::int64_t count, std::int64_t window, const MessageShape& shape);
   // Sends one message every millisecond, each after the answer to the last; seconds per answer.
   std::vector<double> ping(int count, const MessageShape& shape);
+  // Asks something that looks nothing up in a long list; seconds to the answer.
+  double ask();
+  // Stops its session.
+  void stop();
   // Creates (and does not start) sessions from that identifier on.
   void createSessions(std::int64_t first, std::int64_t count);
 

@@ -60,8 +60,8 @@ Process::Process(const std::vector<std::string>& command,
   variables.pop_back();
   for (char** variable = environ; *variable != nullptr; ++variable) variables.push_back(*variable);
   variables.push_back(nullptr);
-  const int error = ::posix_spawn(&pid_, arguments.front().c_str(), nullptr, nullptr,
-                                  pointers(arguments).data(), variables.data());
+  const int error = ::posix_spawnp(&pid_, arguments.front().c_str(), nullptr, nullptr,
+                                   pointers(arguments).data(), variables.data());
   if (error != 0) throw std::runtime_error(command.front() + ": " + std::strerror(error));
 }
 
@@ -96,8 +96,27 @@ nanoseconds Process::settledCpuTime() const {
   }
 }
 
+void Process::waitForRest() const {
+  constexpr milliseconds kLook{200};
+  nanoseconds before = cpuTime();
+  for (;;) {
+    std::this_thread::sleep_for(kLook);
+    const nanoseconds now = cpuTime();
+    if (now - before < kLook / 20) return;
+    before = now;
+  }
+}
+
 long Process::residentKib() const {
   return statusNumber("/proc/" + std::to_string(pid_) + "/status", "VmRSS");
+}
+
+long Process::peakKib() const {
+  return statusNumber("/proc/" + std::to_string(pid_) + "/status", "VmHWM");
+}
+
+void Process::forgetPeak() const {
+  std::ofstream("/proc/" + std::to_string(pid_) + "/clear_refs") << "5";
 }
 
 long Process::sleeps() const {

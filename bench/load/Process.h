@@ -11,7 +11,8 @@ namespace halvox::bench {
 // A server process under measurement. Started by the constructor, ended by the destructor.
 class Process {
  public:
-  // Runs a program with these arguments and additional environment ("NAME=value").
+  // Runs a program, by its path or as found in $PATH, with these arguments and additional
+  // environment ("NAME=value").
   Process(const std::vector<std::string>& command, const std::vector<std::string>& environment);
   ~Process();
   Process(const Process&) = delete;
@@ -23,7 +24,12 @@ class Process {
   [[nodiscard]] std::chrono::nanoseconds cpuTime() const;
   // CPU time once it has come to rest: what is still queued belongs to the work that was measured.
   [[nodiscard]] std::chrono::nanoseconds settledCpuTime() const;
+  // Waits until it does next to nothing: less than a twentieth of what it could, for 200 ms.
+  void waitForRest() const;
   [[nodiscard]] long residentKib() const;
+  // The most resident memory since the start, or since it was told to forget that.
+  [[nodiscard]] long peakKib() const;
+  void forgetPeak() const;
   // How often its threads went to sleep so far; each time is one wake-up.
   [[nodiscard]] long sleeps() const;
 

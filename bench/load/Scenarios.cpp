@@ -3,12 +3,11 @@
 #include <atomic>
 #include <chrono>
 #include <ctime>
-#include <fstream>
 #include <functional>
 #include <memory>
 #include <thread>
 
-#include "bench/load/Process.h"
+#include "bench/load/Server.h"
 
 namespace halvox::bench {
 namespace {
@@ -24,46 +23,6 @@ std::chrono::nanoseconds ownThreadCpu() {
   ::clock_gettime(CLOCK_THREAD_CPUTIME_ID, &time);
   return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
-
-enum class Kind : std::uint8_t { kEcho, kStored, kUnwanted };
-
-// A server of either kind with a directory of its own.
-class Server {
- public:
-  Server(const LoadOptions& options, Kind kind)
-      : kind_(kind), socket_(directory_.path() + "/s"), process_(start(options, kind)) {
-    process_->waitForSocket(socket_);
-  }
-
-  [[nodiscard]] std::unique_ptr<LoadClient> client(std::int64_t reporter) const {
-    return std::make_unique<LoadClient>(socket_, reporter, kind_ != Kind::kEcho);
-  }
-  [[nodiscard]] std::unique_ptr<LoadClient> idleClient() const {
-    return std::make_unique<LoadClient>(socket_, 0, false);
-  }
-  [[nodiscard]] const Process& process() const { return *process_; }
-
- private:
-  std::unique_ptr<Process> start(const LoadOptions& options, Kind kind) {
-    if (kind == Kind::kEcho) {
-      return std::make_unique<Process>(std::vector<std::string>{options.self, "--echo", socket_},
-                                       std::vector<std::string>{});
-    }
-    const std::string config = directory_.path() + "/halvox.toml";
-    std::ofstream(config) << "[listener]\nsocket = \"" << socket_ << "\"\n[storage]\ndirectory = \""
-                          << directory_.path() << "/state\"\nmax_megabytes = 8192\n"
-                          << "[analytics]\nwanted = [" << (kind == Kind::kStored ? "\"*\"" : "")
-                          << "]\n[limits]\nclient_history_megabytes = 65536\n"
-                          << "client_sessions = 1000000\n[log]\nlevel = \"error\"\n";
-    return std::make_unique<Process>(std::vector<std::string>{options.service},
-                                     std::vector<std::string>{"HALVOX_CONFIG=" + config});
-  }
-
-  Kind kind_;
-  ScratchDirectory directory_;
-  std::string socket_;
-  std::unique_ptr<Process> process_;
-};
 
 struct Cost {
   double messagesPerSecond;
@@ -85,8 +44,8 @@ Cost pipelineCost(const Server& server, LoadClient& client, const LoadOptions& o
   return {messages / seconds, micros(serverCpu) / messages, micros(clientCpu) / messages};
 }
 
-Cost oneRun(const LoadOptions& options, Kind kind) {
-  const Server server(options, kind);
+Cost oneRun(const LoadOptions& options, ServerKind kind) {
+  const Server server(options.programs, kind);
   const auto client = server.client(1);
   client->pipeline(5000, options.window, options.shape);  // warm caches and pools
   return pipelineCost(server, *client, options, options.messages);
@@ -119,7 +78,7 @@ std::vector<double> pingUnderLoad(const Server& server, const LoadOptions& optio
 
 double serverMicrosAfter(const LoadOptions& options,
                          const std::function<void(const Server&, LoadClient&)>& prepare) {
-  const Server server(options, Kind::kUnwanted);
+  const Server server(options.programs, ServerKind::kUnwanted);
   const auto client = server.client(1);
   client->pipeline(5000, options.window, options.shape);
   prepare(server, *client);
@@ -133,9 +92,9 @@ void measureThroughput(const LoadOptions& options, std::vector<Measurement>& res
   std::vector<Cost> stored;
   std::vector<Cost> unwanted;
   for (int round = 0; round < options.rounds; ++round) {
-    echo.push_back(oneRun(options, Kind::kEcho));
-    stored.push_back(oneRun(options, Kind::kStored));
-    unwanted.push_back(oneRun(options, Kind::kUnwanted));
+    echo.push_back(oneRun(options, ServerKind::kEcho));
+    stored.push_back(oneRun(options, ServerKind::kStored));
+    unwanted.push_back(oneRun(options, ServerKind::kUnwanted));
   }
   const auto add = [&](const char* name, const char* unit, const std::vector<Cost>& costs,
                        double Cost::*member, std::optional<double> atMost,
@@ -163,8 +122,8 @@ void measureLatency(const LoadOptions& options, std::vector<Measurement>& result
                        atMost,
                        {}});
   };
-  const Server echo(options, Kind::kEcho);
-  const Server service(options, Kind::kStored);
+  const Server echo(options.programs, ServerKind::kEcho);
+  const Server service(options.programs, ServerKind::kStored);
   const auto idle = [&](const Server& server) {
     return server.client(1)->ping(kPings, options.shape);
   };
@@ -180,7 +139,7 @@ void measureLatency(const LoadOptions& options, std::vector<Measurement>& result
 
 void measureMemory(const LoadOptions& options, std::vector<Measurement>& results) {
   {
-    const Server server(options, Kind::kStored);
+    const Server server(options.programs, ServerKind::kStored);
     std::vector<std::thread> busy;
     for (int number = 0; number < options.clients; ++number) {
       busy.emplace_back([&, number] {
@@ -200,7 +159,7 @@ void measureMemory(const LoadOptions& options, std::vector<Measurement>& results
          24.0,
          {}});
   }
-  const Server server(options, Kind::kUnwanted);
+  const Server server(options.programs, ServerKind::kUnwanted);
   const auto client = server.client(1);
   client->pipeline(5000, options.window, options.shape);
   const long before = server.process().residentKib();
@@ -240,7 +199,7 @@ void measureGrowth(const LoadOptions& options, std::vector<Measurement>& results
 }
 
 void measureIdle(const LoadOptions& options, std::vector<Measurement>& results) {
-  const Server server(options, Kind::kStored);
+  const Server server(options.programs, ServerKind::kStored);
   const auto client = server.client(1);
   client->pipeline(1000, options.window, options.shape);
   (void)server.process().settledCpuTime();

@@ -1,17 +1,16 @@
 #pragma once
 
 #include <cstdint>
-#include <string>
 #include <vector>
 
 #include "bench/load/LoadClient.h"
 #include "bench/load/Report.h"
+#include "bench/load/Server.h"
 
 namespace halvox::bench {
 
 struct LoadOptions {
-  std::string service;  // the program under measurement
-  std::string self;     // this program, which is the echo too
+  ServerPrograms programs;
   std::int64_t messages = 200'000;
   std::int64_t window = 64;
   int clients = 4;  // for memory and latency under load
@@ -25,5 +24,6 @@ void measureLatency(const LoadOptions& options, std::vector<Measurement>& result
 void measureMemory(const LoadOptions& options, std::vector<Measurement>& results);
 void measureGrowth(const LoadOptions& options, std::vector<Measurement>& results);
 void measureIdle(const LoadOptions& options, std::vector<Measurement>& results);
+void measureStop(const LoadOptions& options, std::vector<Measurement>& results);
 
 }  // namespace halvox::bench

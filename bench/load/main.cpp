@@ -22,7 +22,8 @@ const std::vector<std::pair<std::string, Scenario>>& scenarios() {
       {"latency", halvox::bench::measureLatency},
       {"memory", halvox::bench::measureMemory},
       {"growth", halvox::bench::measureGrowth},
-      {"idle", halvox::bench::measureIdle}};
+      {"idle", halvox::bench::measureIdle},
+      {"stop", halvox::bench::measureStop}};
   return all;
 }
 
@@ -31,15 +32,16 @@ int run(int argc, char** argv) {
       "Measures the reporting service under load, beside a raw sd-bus echo of the same messages in "
       "the same run. Numbers of one run compare; numbers of different machines do not."};
   LoadOptions options;
-  options.self = std::filesystem::read_symlink("/proc/self/exe").string();
-  options.service =
-      (std::filesystem::path(options.self).parent_path() / "halvox-reportingd").string();
+  options.programs.echo = std::filesystem::read_symlink("/proc/self/exe").string();
+  options.programs.service =
+      (std::filesystem::path(options.programs.echo).parent_path() / "halvox-reportingd").string();
   std::string echoSocket;
   std::string json;
   std::vector<std::string> chosen;
   std::vector<std::string> names;
   for (const auto& [name, scenario] : scenarios()) names.push_back(name);
-  app.add_option("--service", options.service, "The service to measure")->capture_default_str();
+  app.add_option("--service", options.programs.service, "The service to measure")
+      ->capture_default_str();
   app.add_option("--scenario", chosen, "What to measure (default: all)")
       ->check(CLI::IsMember(names));
   app.add_option("--messages", options.messages, "Messages per run")

@@ -1,0 +1,228 @@
+// Messages a second from a client through the service and its link into the local store and onto a
+// JetStream, beside the client library's own asynchronous publish of the same bytes to the same
+// server in the same run. A message counts when it is stored there. Runs a server of its own:
+//
+//   halvox_link_load [MESSAGES [ROUNDS]]
+#include <algorithm>
+#include <chrono>
+#include <cstdio>
+#include <cstdlib>
+#include <exception>
+#include <filesystem>
+#include <functional>
+#include <stdexcept>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <arpa/inet.h>
+#include <nats/nats.h>
+#include <netinet/in.h>
+#include <sqlite3.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include "bench/load/Report.h"
+#include "bench/load/Server.h"
+#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/link/nats/NatsHandles.h"
+
+namespace halvox::bench {
+namespace {
+
+using namespace platform::linux_;
+using Clock = std::chrono::steady_clock;
+using Database = UniqueHandle<sqlite3*, sqlite3_close>;
+using Statement = UniqueHandle<sqlite3_stmt*, sqlite3_finalize>;
+using StreamInfo = UniqueHandle<jsStreamInfo*, jsStreamInfo_Destroy>;
+
+constexpr const char* kStream = "HALVOX";
+constexpr std::int64_t kWindow = 64;     // requests without an answer, of the client
+constexpr std::int64_t kPending = 8192;  // messages without one, of the plain library
+constexpr std::int64_t kWarmUp = 2000;
+constexpr std::chrono::milliseconds kPoll{2};
+constexpr std::chrono::minutes kPatience{2};
+
+double perSecond(std::int64_t messages, Clock::time_point began) {
+  return static_cast<double>(messages) /
+         std::chrono::duration<double>(Clock::now() - began).count();
+}
+
+void waitUntil(const char* what, const std::function<bool()>& isTrue) {
+  for (const auto end = Clock::now() + kPatience; !isTrue(); std::this_thread::sleep_for(kPoll)) {
+    if (Clock::now() > end) throw std::runtime_error(std::string("waited in vain for ") + what);
+  }
+}
+
+int freePort() {
+  const UniqueFd socket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  sockaddr_in address{};
+  address.sin_family = AF_INET;
+  address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+  socklen_t length = sizeof address;
+  auto* const any = reinterpret_cast<sockaddr*>(&address);
+  if (::bind(socket.get(), any, length) != 0 || ::getsockname(socket.get(), any, &length) != 0) {
+    throw std::runtime_error("no free port");
+  }
+  return ntohs(address.sin_port);
+}
+
+// A server with JetStream, and a connection of the plain library to it.
+class JetStream {
+ public:
+  JetStream()
+      : port_(std::to_string(freePort())),
+        process_({"nats-server", "-js", "-sd", directory_.path(), "-a", "127.0.0.1", "-p", port_,
+                  "-l", directory_.path() + "/log"},
+                 {}) {
+    waitUntil("nats-server", [this] {
+      return natsConnection_ConnectTo(connection_.out(), url().c_str()) == NATS_OK;
+    });
+    jsOptions options;
+    jsOptions_Init(&options);
+    options.PublishAsync.MaxPending = kPending;
+    options.PublishAsync.StallWait = 10'000;
+    if (natsConnection_JetStream(context_.out(), connection_.get(), &options) != NATS_OK) {
+      throw std::runtime_error("no JetStream");
+    }
+  }
+
+  [[nodiscard]] std::string url() const { return "nats://127.0.0.1:" + port_; }
+
+  [[nodiscard]] std::int64_t messages() const {
+    StreamInfo info;
+    const bool isThere =
+        js_GetStreamInfo(info.out(), context_.get(), kStream, nullptr, nullptr) == NATS_OK;
+    return isThere ? static_cast<std::int64_t>(info.get()->State.Msgs) : 0;
+  }
+
+  // One of the messages there.
+  [[nodiscard]] NatsMessage message() const {
+    NatsMessage message;
+    if (js_GetMsg(message.out(), context_.get(), kStream, kWarmUp / 2, nullptr, nullptr) !=
+        NATS_OK) {
+      throw std::runtime_error("no message on the stream");
+    }
+    return message;
+  }
+
+  // Publishes `like` over and over, with identifiers as long as its own.
+  double publish(const NatsMessage& like, std::int64_t messages) {
+    const char* id = nullptr;
+    if (natsMsgHeader_Get(like.get(), "Nats-Msg-Id", &id) != NATS_OK) {
+      throw std::runtime_error("a message without an identifier");
+    }
+    const auto width = static_cast<int>(std::string(id).size());
+    jsPubOptions options;
+    jsPubOptions_Init(&options);
+    const auto began = Clock::now();
+    for (std::int64_t number = 0; number < messages; ++number) {
+      char text[64];
+      std::snprintf(text, sizeof text, "%0*lld", width, static_cast<long long>(++published_));
+      options.MsgId = text;
+      if (js_PublishAsync(context_.get(), natsMsg_GetSubject(like.get()),
+                          natsMsg_GetData(like.get()), natsMsg_GetDataLength(like.get()),
+                          &options) != NATS_OK) {
+        throw std::runtime_error("the plain library cannot publish");
+      }
+    }
+    options.MaxWait = 60'000;
+    options.MsgId = nullptr;
+    if (js_PublishAsyncComplete(context_.get(), &options) != NATS_OK) {
+      throw std::runtime_error("the plain library got no acknowledgements");
+    }
+    return perSecond(messages, began);
+  }
+
+ private:
+  ScratchDirectory directory_;
+  std::string port_;
+  Process process_;
+  NatsConnection connection_;
+  JetStreamContext context_;
+  std::int64_t published_ = 0;
+};
+
+std::int64_t storedMessages(const std::string& path) {
+  Database database;
+  Statement statement;
+  // The service may be making the file; then the next look tells.
+  if (sqlite3_open_v2(path.c_str(), database.out(), SQLITE_OPEN_READONLY, nullptr) != SQLITE_OK ||
+      sqlite3_prepare_v2(database.get(), "SELECT max(id) FROM link_message_records", -1,
+                         statement.out(), nullptr) != SQLITE_OK ||
+      sqlite3_step(statement.get()) != SQLITE_ROW) {
+    return 0;
+  }
+  return sqlite3_column_int64(statement.get(), 0);
+}
+
+// What one client gets through the service, counted by `stored`.
+double through(const Server& server, std::int64_t messages,
+               const std::function<std::int64_t()>& stored) {
+  const MessageShape shape;
+  const std::int64_t before = stored();
+  const auto client = server.client(1);
+  client->pipeline(kWarmUp, kWindow, shape);
+  waitUntil("the first messages", [&] { return stored() >= before + kWarmUp; });
+  const auto began = Clock::now();
+  client->pipeline(messages, kWindow, shape);
+  waitUntil("the messages", [&] { return stored() >= before + kWarmUp + messages; });
+  return perSecond(messages, began);
+}
+
+struct Run {
+  ServerPrograms programs;
+  std::int64_t messages;
+  int rounds;
+};
+
+double toLocal(const Run& run, ServerKind kind) {
+  const Server server(run.programs, kind);
+  return through(server, run.messages, [&] { return storedMessages(server.database()); });
+}
+
+double toJetStream(const Run& run, ServerKind kind, const JetStream& stream) {
+  const Server server(run.programs, kind,
+                      "[link]\nbackend = \"nats\"\nservers = [\"" + stream.url() + "\"]\n");
+  return through(server, run.messages, [&] { return stream.messages(); });
+}
+
+void compare(const Run& run) {
+  constexpr std::size_t kRows = 5;
+  const char* const names[kRows] = {"local, no event wanted", "local, both events stored",
+                                    "JetStream, no event wanted", "JetStream, both events stored",
+                                    "plain library to JetStream"};
+  JetStream stream;
+  std::vector<double> values[kRows];
+  for (int round = 0; round < run.rounds; ++round) {
+    values[0].push_back(toLocal(run, ServerKind::kUnwanted));
+    values[1].push_back(toLocal(run, ServerKind::kStored));
+    values[2].push_back(toJetStream(run, ServerKind::kUnwanted, stream));
+    values[3].push_back(toJetStream(run, ServerKind::kStored, stream));
+    values[4].push_back(stream.publish(stream.message(), run.messages));
+  }
+  std::printf("%lld messages of %d bytes of JSON, median of %d rounds, messages a second:\n",
+              static_cast<long long>(run.messages), natsMsg_GetDataLength(stream.message().get()),
+              run.rounds);
+  for (std::size_t row = 0; row < kRows; ++row) {
+    std::printf("  %-30s %10.0f  %.2f\n", names[row], median(values[row]),
+                median(values[row]) / median(values[kRows - 1]));
+  }
+}
+
+}  // namespace
+}  // namespace halvox::bench
+
+int main(int argc, char** argv) {
+  try {
+    const auto here = std::filesystem::read_symlink("/proc/self/exe").parent_path();
+    halvox::bench::compare(
+        {.programs = {.service = (here / "halvox-reportingd").string(), .echo = {}},
+         .messages = argc > 1 ? std::atoll(argv[1]) : 100'000,
+         .rounds = argc > 2 ? std::atoi(argv[2]) : 3});
+  } catch (const std::exception& error) {
+    std::fprintf(stderr, "halvox_link_load: %s\n", error.what());
+    return EXIT_FAILURE;
+  }
+  return EXIT_SUCCESS;
+}

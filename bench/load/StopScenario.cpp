@@ -1,0 +1,99 @@
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "bench/load/Scenarios.h"
+
+// What the stop of a session with a long history costs the service, its client and the others.
+namespace halvox::bench {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+constexpr std::int64_t kHistory = 1'000'000;
+constexpr std::chrono::milliseconds kAskEvery{10};
+
+double secondsSince(Clock::time_point begin) {
+  return std::chrono::duration<double>(Clock::now() - begin).count();
+}
+
+// A client that asks every 10 ms, also when an answer took longer, from its making to stop().
+class OtherClient {
+ public:
+  explicit OtherClient(const Server& server)
+      : client_(server.idleClient()), thread_([this] { run(); }) {}
+  ~OtherClient() { end(); }
+  OtherClient(const OtherClient&) = delete;
+  OtherClient& operator=(const OtherClient&) = delete;
+
+  // The seconds that each answer took.
+  std::vector<double> end() {
+    ending_ = true;
+    if (thread_.joinable()) thread_.join();
+    return waits_;
+  }
+
+ private:
+  void run() {
+    auto next = Clock::now();
+    while (!ending_) {
+      waits_.push_back(client_->ask());
+      next = std::max(next + kAskEvery, Clock::now());
+      std::this_thread::sleep_until(next);
+    }
+  }
+
+  std::unique_ptr<LoadClient> client_;
+  std::vector<double> waits_;        // of the thread until it has ended
+  std::atomic<bool> ending_{false};  // orders with nothing: the thread is joined
+  std::thread thread_;
+};
+
+struct Build {
+  std::string name;
+  std::string settings;
+};
+
+void measure(const LoadOptions& options, const Build& build, std::vector<Measurement>& results) {
+  const Server server(options.programs, ServerKind::kStored, build.settings);
+  const auto client = server.client(1);
+  client->pipeline(kHistory, options.window, options.shape);
+  server.process().waitForRest();
+  const long before = server.process().residentKib();
+  server.process().forgetPeak();
+
+  OtherClient other(server);
+  const auto begin = Clock::now();
+  client->stop();
+  const double seconds = secondsSince(begin);
+  server.process().waitForRest();
+  const double atRest = secondsSince(begin);
+  const std::vector<double> waits = other.end();
+
+  const auto add = [&](const char* what, const char* unit, double value,
+                       std::optional<double> atMost) {
+    results.push_back({build.name + ": " + what, unit, value, {}, atMost, {}});
+  };
+  add("answer to the stop", "s", seconds, 5.0);
+  add("until the service is at rest again", "s", atRest, {});
+  add("longest wait of another client", "s", *std::ranges::max_element(waits), {});
+  add("median wait of another client", "us", median(waits) * 1e6, {});
+  add("resident memory before", "MiB", static_cast<double>(before) / 1024, {});
+  add("most resident memory, times that", "x",
+      static_cast<double>(server.process().peakKib()) / static_cast<double>(before), 2.0);
+}
+
+}  // namespace
+
+void measureStop(const LoadOptions& options, std::vector<Measurement>& results) {
+  measure(options, {"stop of 1,000,000 messages, no link", "[link]\nbackend = \"none\"\n"},
+          results);
+  measure(options, {"stop of 1,000,000 messages", ""}, results);
+  measure(options, {"the same on an internal build", "[device]\nInternalBuild = true\n"}, results);
+}
+
+}  // namespace halvox::bench
