@@ -7,7 +7,7 @@
 #define LTTNG_UST_TRACEPOINT_DEFINE
 #include "platform/linux/runtime/lttng/kdebug_provider.h"
 
-const int *const halvox_trace_state = &lttng_ust_tracepoint_halvox___kdebug.state;
+const int* const halvox_trace_state = &lttng_ust_tracepoint_halvox___kdebug.state;
 
 void halvox_trace_emit(uint32_t code, uint64_t argument1, uint64_t argument2, uint64_t argument3,
                        uint64_t argument4) {
@@ -17,7 +17,7 @@ void halvox_trace_emit(uint32_t code, uint64_t argument1, uint64_t argument2, ui
 #else
 
 static const int nobody_traces = 0;
-const int *const halvox_trace_state = &nobody_traces;
+const int* const halvox_trace_state = &nobody_traces;
 
 void halvox_trace_emit(uint32_t code, uint64_t argument1, uint64_t argument2, uint64_t argument3,
                        uint64_t argument4) {

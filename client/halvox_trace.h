@@ -10,8 +10,8 @@
  *
  * The service records the codes from 0x21040000 to 0x2104408A. While no trace runs, a trace point
  * looks at one number and goes on. While one does, it writes the time, the thread and the process
- * beside its numbers into a buffer and never waits: an event that finds no room is lost, and counted
- * by the trace. Any thread may call, also a real-time one.
+ * beside its numbers into a buffer and never waits: an event that finds no room is lost, and
+ * counted by the trace. Any thread may call, also a real-time one.
  *
  * Link with -lhalvox-trace. The library loads the LTTng tracer, which has two threads in the
  * process that sleep until a tracer's daemon runs. Built without LTTng it emits nothing. */
@@ -23,7 +23,7 @@ extern "C" {
 #endif
 
 /* Not 0 while a trace records these events. For halvox_trace() alone. */
-extern const int *const halvox_trace_state;
+extern const int* const halvox_trace_state;
 /* Emits in any case. For halvox_trace() alone. */
 void halvox_trace_emit(uint32_t code, uint64_t argument1, uint64_t argument2, uint64_t argument3,
                        uint64_t argument4);
