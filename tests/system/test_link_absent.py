@@ -1,0 +1,111 @@
+"""A link without back-ends: the session tells so once, drops what it would have sent, and nobody else
+notices."""
+
+import json
+import re
+import signal
+import statistics
+import time
+import unittest
+
+from harness import Service, wait_for
+from nats import SilentServer, free_ports
+
+MESSAGES = 300
+REPORTER = 7
+TIME_OUT = 9  # seconds that a session waits for back-ends
+NO_BACKENDS = "no backends found, this session won't get sent to the server"
+FAILED = "failed to find backend"
+TIMED_OUT = "timed out waiting for backends"
+
+
+def link(backend, *servers):
+    return f'[link]\nbackend = "{backend}"\n' + (f"servers = {json.dumps(servers)}\n" if servers else "")
+
+
+def counters(service, piece):
+    """What the running service counted of a piece, by name."""
+    said = len(service.log())
+    service.process.send_signal(signal.SIGUSR1)
+    # Pieces come in the order of their names, so these are the last lines.
+    wait_for("the counters", lambda: "counted snapshots, stored: " in service.log()[said:])
+    return {name: int(value) for name, value
+            in re.findall(rf"counted {piece}, (.*): (\d+)$", service.log()[said:], re.MULTILINE)}
+
+
+class AbsentLinkTest(unittest.TestCase):
+    def service(self, config):
+        service = Service(config)
+        self.addCleanup(service.__exit__, None, None, None)
+        return service.start()
+
+    def start_session(self, service):
+        client = service.client()
+        self.addCleanup(client.close)
+        client.create(REPORTER)
+        client.start_later(REPORTER)
+        return client
+
+    @staticmethod
+    def latencies(*clients):
+        """Seconds to the answers of numbered messages to the started session, for each client. They
+        take turns, so that whatever else the machine does is the same for all."""
+        taken = [[] for _ in clients]
+        for number in range(MESSAGES):
+            for client, times in zip(clients, taken, strict=True):
+                begin = time.perf_counter()
+                client.send({"number": number}, reporters=[REPORTER])
+                times.append(time.perf_counter() - begin)
+        return taken
+
+    def assert_nobody_notices(self, service, client):
+        usual = self.service(link("local"))
+        taken, expected = self.latencies(client, self.start_session(usual))
+
+        print(f"\nmedian of an answer {statistics.median(taken) * 1e6:.0f} us, "
+              f"with a back-end {statistics.median(expected) * 1e6:.0f} us, "
+              f"longest {max(taken) * 1e3:.1f} and {max(expected) * 1e3:.1f} ms", flush=True)
+        self.assertLess(statistics.median(taken), 2 * statistics.median(expected))
+        # Nobody waits for the discovery, which takes seconds.
+        self.assertLess(max(taken), 1)
+        self.assertEqual(len(service.wait_for_events(2 * MESSAGES)), 2 * MESSAGES)
+
+    def assert_dropped_by_the_link_alone(self, service, client):
+        self.assertIs(client.stop(REPORTER), True)
+        # The summary of the session is one message more.
+        counted = wait_for("the link to drop all", lambda: (
+            now := counters(service, "link"))["dropped: no back-end"] == MESSAGES + 1 and now)
+        self.assertEqual(counted["received"], MESSAGES + 1)
+        self.assertEqual(counted["sent"] + counted["failed"], 0)
+        session = counters(service, "session")
+        self.assertEqual((session["received"], session["recorded"]), (MESSAGES + 1, MESSAGES + 1))
+
+    def assert_session_fails(self, config):
+        service = self.service(config)
+        client = self.start_session(service)
+        begun = time.monotonic()
+
+        self.assert_nobody_notices(service, client)
+        wait_for("the discovery to fail", lambda: FAILED in service.log())
+        seconds = time.monotonic() - begun
+        self.assert_dropped_by_the_link_alone(service, client)
+
+        # The back-end gives up before the session does.
+        self.assertLess(seconds, TIME_OUT)
+        self.assertLess(service.log().index(NO_BACKENDS), service.log().index(FAILED))
+        self.assertEqual(service.log().count(FAILED), 1)
+        self.assertNotIn(TIMED_OUT, service.log())
+
+    def test_without_a_back_end_messages_are_dropped_by_the_link_alone(self):
+        self.assert_session_fails(link("none"))
+
+    def test_no_server_at_the_address_is_told_and_clients_notice_nothing(self):
+        self.assert_session_fails(link("nats", f"nats://127.0.0.1:{free_ports(1)[0]}"))
+
+    def test_a_server_that_says_nothing_holds_back_the_link_alone(self):
+        with SilentServer() as silent:
+            self.assert_session_fails(link("nats", silent.url))
+
+
+if __name__ == "__main__":
+    unittest.main()
