@@ -25,6 +25,7 @@ class SystemClock final : public ClockService {
     const auto now = std::chrono::system_clock::now().time_since_epoch();
     return {std::chrono::duration<double>(now).count()};
   }
+  [[nodiscard]] LocalTime localTime(Date /*date*/) const override { return {}; }
   [[nodiscard]] std::chrono::duration<double> systemUptime() const override { return {}; }
   [[nodiscard]] std::chrono::milliseconds processUptime() const override { return {}; }
 };

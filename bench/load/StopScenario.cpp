@@ -67,9 +67,11 @@ void measure(const LoadOptions& options, const Build& build, std::vector<Measure
   server.process().forgetPeak();
 
   OtherClient other(server);
+  const auto cpuBefore = server.process().cpuTime();
   const auto begin = Clock::now();
   client->stop();
   const double seconds = secondsSince(begin);
+  const std::chrono::duration<double> cpu = server.process().cpuTime() - cpuBefore;
   server.process().waitForRest();
   const double atRest = secondsSince(begin);
   const std::vector<double> waits = other.end();
@@ -79,6 +81,7 @@ void measure(const LoadOptions& options, const Build& build, std::vector<Measure
     results.push_back({build.name + ": " + what, unit, value, {}, atMost, {}});
   };
   add("answer to the stop", "s", seconds, 5.0);
+  add("CPU time of the service until then", "s", cpu.count(), {});
   add("until the service is at rest again", "s", atRest, {});
   add("longest wait of another client", "s", *std::ranges::max_element(waits), {});
   add("median wait of another client", "us", median(waits) * 1e6, {});
