@@ -226,7 +226,7 @@ void PipewireConnection::onCoreInfo(void* data, const pw_core_info* info) {
   // It is told again when the server's properties change.
   if (std::exchange(self->isReached_, true)) return;
   self->isMissingTold_ = false;
-  kLog.info("following PipeWire ", info->version, " (", info->name, ")");
+  kLog.notice("following PipeWire ", info->version, " (", info->name, ")");
   const MutexLock lock(self->graph_.mutex);
   self->graph_.statistics.serverReached();
 }
@@ -250,7 +250,7 @@ void PipewireConnection::onCoreError(void* data, std::uint32_t id, int /*sequenc
     return;
   }
   if (std::exchange(self->isLost_, true)) return;
-  kLog.info("PipeWire has gone");
+  kLog.notice("PipeWire has gone");
   // Later, because the connection cannot be closed from within its own callback.
   self->updateAfter(Clock::duration::zero());
 }
