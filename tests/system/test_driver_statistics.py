@@ -1,7 +1,9 @@
 """What PipeWire's sinks counted while a session ran, from a real PipeWire to the store."""
 
 import contextlib
+import json
 import re
+import sqlite3
 import subprocess
 import time
 import unittest
@@ -108,6 +110,22 @@ class DriverStatisticsTest(unittest.TestCase):
         self.check_histogram("busytime", cycles)
         self.check_histogram("waittime", cycles)
         self.check_state(cycles * length)
+        self.check_link()
+
+    def check_link(self):
+        """The same went through the session to the real-time link."""
+        query = "SELECT type, payload FROM link_messages WHERE category = 12"
+
+        def sent():
+            with contextlib.closing(
+                    sqlite3.connect(f"file:{self.service.database}?mode=ro", uri=True)) as store:
+                return {kind: json.loads(payload) for kind, payload in store.execute(query)}
+
+        messages = wait_for("three messages on the link", lambda: len(found := sent()) == 3 and found)
+        for number, kind in ((16, "Simple"), (17, "Histogram"), (18, "State")):
+            stored = self.statistics(kind)[0]
+            self.assertEqual({key: messages[number][key] for key in stored if key.startswith(SINK)},
+                             {key: value for key, value in stored.items() if key.startswith(SINK)})
 
     def check_histogram(self, name, cycles):
         text = self.wait_for_statistics("Histogram")[SINK + f"Histogram_{name}"]
