@@ -1,63 +1,100 @@
 #include "platform/linux/store/IndentedJsonArray.h"
 
-#include <rapidjson/memorystream.h>
-#include <rapidjson/prettywriter.h>
-#include <rapidjson/reader.h>
+#include <string>
+
 #include <rapidjson/stringbuffer.h>
+#include <rapidjson/writer.h>
 
 #include "platform/linux/store/PayloadEncoder.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr unsigned kIndent = 2;
+constexpr std::size_t kIndent = 2;
+constexpr std::size_t kObjectDepth = 2;  // of an object's own entries: the array, and its key
 
-// Passes numbers on as they stand; RapidJSON's own way would put them between quotes.
-class Writer : public rapidjson::PrettyWriter<rapidjson::StringBuffer> {
- public:
-  using PrettyWriter::PrettyWriter;
-  bool RawNumber(const char* text, rapidjson::SizeType length, bool /*copy*/) {
-    return RawValue(text, length, rapidjson::kNumberType);
-  }
-};
+// Where the string that begins at `begin` ends: behind its closing quote.
+std::size_t endOfString(std::string_view json, std::size_t begin) {
+  std::size_t at = begin + 1;
+  while (json[at] != '"') at += json[at] == '\\' ? 2 : 1;
+  return at + 1;
+}
+
+bool closes(char character) { return character == '}' || character == ']'; }
 
 }  // namespace
 
 class IndentedJsonArray::Text {
  public:
-  Text() {
-    writer_.SetIndent(' ', kIndent);
-    writer_.StartArray();
+  void append(std::string_view key, const Dictionary& object) {
+    text_ += isEmpty_ ? "[\n  {\n    " : ",\n  {\n    ";
+    isEmpty_ = false;
+    appendKey(key);
+    text_ += ": ";
+    indent(encoder_.encode(object));
+    text_ += "\n  }";
   }
+  void end() { text_ += isEmpty_ ? "[]\n" : "\n]\n"; }
 
-  // The encoder's text is read again only to be indented, so that there is one set of rules.
-  void append(const Dictionary& object) {
-    constexpr unsigned kFlags =
-        rapidjson::kParseNumbersAsStringsFlag | rapidjson::kParseIterativeFlag;
-    const std::string_view compact = encoder_.encode(object);
-    rapidjson::MemoryStream stream(compact.data(), compact.size());
-    reader_.Parse<kFlags>(stream, writer_);
-  }
-  void end() {
-    writer_.EndArray();
-    buffer_.Put('\n');
-  }
   std::string_view take() {
-    if (isTaken_) buffer_.Clear();
     isTaken_ = true;
-    return {buffer_.GetString(), buffer_.GetSize()};
+    return text_;
   }
   // Lets go of what was taken, before anything is added.
   void begin() {
-    if (isTaken_) buffer_.Clear();
+    if (isTaken_) text_.clear();
     isTaken_ = false;
   }
 
  private:
+  // Not by a Dictionary: keys that are different each time would fill the table of shared ones.
+  void appendKey(std::string_view key) {
+    key_.Clear();
+    rapidjson::Writer<rapidjson::StringBuffer> writer(key_);
+    writer.String(key.data(), static_cast<rapidjson::SizeType>(key.size()));
+    text_.append(key_.GetString(), key_.GetSize());
+  }
+
+  // Adds compact JSON with line breaks. The text is the encoder's own and known to be well-formed;
+  // parsing it would take several times as long, and a session that is stopped waits for this.
+  void indent(std::string_view json) {
+    std::size_t depth = kObjectDepth;
+    for (std::size_t at = 0; at < json.size(); ++at) {
+      const char character = json[at];
+      if (character == '"') {
+        const std::size_t end = endOfString(json, at);
+        text_.append(json, at, end - at);
+        at = end - 1;
+      } else if (character == '{' || character == '[') {
+        text_ += character;
+        if (closes(json[at + 1])) {
+          text_ += json[++at];
+        } else {
+          breakLine(++depth);
+        }
+      } else if (closes(character)) {
+        breakLine(--depth);
+        text_ += character;
+      } else if (character == ',') {
+        text_ += character;
+        breakLine(depth);
+      } else if (character == ':') {
+        text_ += ": ";
+      } else {
+        text_ += character;
+      }
+    }
+  }
+
+  void breakLine(std::size_t depth) {
+    text_ += '\n';
+    text_.append(depth * kIndent, ' ');
+  }
+
   PayloadEncoder encoder_;
-  rapidjson::Reader reader_;
-  rapidjson::StringBuffer buffer_;
-  Writer writer_{buffer_};
+  rapidjson::StringBuffer key_;
+  std::string text_;
+  bool isEmpty_ = true;
   bool isTaken_ = false;
 };
 
@@ -66,7 +103,7 @@ IndentedJsonArray::~IndentedJsonArray() = default;
 
 void IndentedJsonArray::appendObject(std::string_view key, const Dictionary& value) {
   text_->begin();
-  text_->append(Dictionary{{Key(key), Value(value)}});
+  text_->append(key, value);
 }
 
 void IndentedJsonArray::end() {

@@ -16,7 +16,7 @@ class IndentedJsonArray {
   IndentedJsonArray& operator=(const IndentedJsonArray&) = delete;
   ~IndentedJsonArray();
 
-  // Appends `{key: value}`, and the text before it.
+  // Appends `{key: value}`, and the text before it. The key is UTF-8.
   void appendObject(std::string_view key, const Dictionary& value);
   // Ends the array; nothing may be appended any more.
   void end();

@@ -67,6 +67,35 @@ TEST(IndentedJsonArrayTest, ValuesHaveTheFormOfPayloads) {
 )");
 }
 
+TEST(IndentedJsonArrayTest, SignsWithinStringsAreLeftAlone) {
+  IndentedJsonArray json;
+  json.appendObject("a{,}:", {{"b[\"", "{\"x\": [1,2]}\\"}, {"c", Array{Array{}, Dictionary{}}}});
+  json.end();
+
+  EXPECT_EQ(json.takeText(), R"([
+  {
+    "a{,}:": {
+      "b[\"": "{\"x\": [1,2]}\\",
+      "c": [
+        [],
+        {}
+      ]
+    }
+  }
+]
+)");
+}
+
+TEST(IndentedJsonArrayTest, KeysTakeNoPlaceInTheTableOfSharedOnes) {
+  IndentedJsonArray json;
+  for (int number = 0; number < 100'000; ++number) {
+    json.appendObject("one_of_many_keys_" + std::to_string(number), {});
+    static_cast<void>(json.takeText());
+  }
+
+  EXPECT_TRUE(Key("a key that is new after many in an array").isInterned());
+}
+
 TEST(IndentedJsonArrayTest, PiecesThatAreTakenMakeTheSameText) {
   IndentedJsonArray whole;
   IndentedJsonArray pieces;
