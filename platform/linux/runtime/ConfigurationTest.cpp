@@ -91,7 +91,18 @@ TEST_F(ConfigurationTest, MissingFileMeansDefaults) {
   EXPECT_EQ(configuration.preferencesDirectory, directory_ / ".local/state/halvox/preferences");
   EXPECT_EQ(configuration.notifyDirectory, directory_ / ".local/state/halvox/notify");
   EXPECT_EQ(configuration.logLevel, LogLevel::kDefault);
+  EXPECT_EQ(configuration.logMemoryLevel, LogLevel::kInfo);
+  EXPECT_EQ(configuration.keepSnapshots, 20U);
   EXPECT_EQ(configuration.analytics.wanted, std::vector<std::string>{"*"});
+}
+
+TEST_F(ConfigurationTest, LevelsOfTheLogAndOfItsMemoryAreTwoThings) {
+  const Configuration written = loaded("[log]\nlevel = \"error\"");
+  const Configuration kept = loaded("[log]\nmemory_level = \"debug\"");
+
+  EXPECT_EQ(written.logMemoryLevel, LogLevel::kInfo);
+  EXPECT_EQ(kept.logLevel, LogLevel::kDefault);
+  EXPECT_EQ(kept.logMemoryLevel, LogLevel::kDebug);
 }
 
 TEST_F(ConfigurationTest, EnvironmentGivesTheDefaultDirectories) {
@@ -160,6 +171,9 @@ client_history_megabytes = 12
 client_sessions = 34
 [log]
 level = "debug"
+memory_level = "error"
+[diagnostics]
+keep_snapshots = 3
 )");
 
   EXPECT_EQ(configuration.listener.socket, "/tmp/r.sock");
@@ -174,6 +188,8 @@ level = "debug"
   EXPECT_EQ(configuration.limits.clientHistoryMegabytes, 12U);
   EXPECT_EQ(configuration.limits.clientSessions, 34U);
   EXPECT_EQ(configuration.logLevel, LogLevel::kDebug);
+  EXPECT_EQ(configuration.logMemoryLevel, LogLevel::kError);
+  EXPECT_EQ(configuration.keepSnapshots, 3U);
 }
 
 TEST_F(ConfigurationTest, RootFollowsTheDirectory) {
@@ -316,6 +332,15 @@ INSTANTIATE_TEST_SUITE_P(
         MistakeCase{"UnknownChoice", "[log]\nlevel = \"verbose\"",
                     "2:9: log.level: expected \"debug\" or \"info\" or \"default\" or \"error\", "
                     "found the string \"verbose\""},
+        MistakeCase{"UnknownMemoryLevel", "[log]\nmemory_level = 1",
+                    "2:16: log.memory_level: expected \"debug\" or \"info\" or \"default\" or "
+                    "\"error\", found 1"},
+        MistakeCase{"NoSnapshots", "[diagnostics]\nkeep_snapshots = 0",
+                    "2:18: diagnostics.keep_snapshots: expected an integer from 1 to 10000, found "
+                    "0"},
+        MistakeCase{"TooManySnapshots", "[diagnostics]\nkeep_snapshots = 10001",
+                    "2:18: diagnostics.keep_snapshots: expected an integer from 1 to 10000, found "
+                    "10001"},
         MistakeCase{"SinkThatThisProgramLacks", "[analytics]\nsink = \"nats\"",
                     "2:8: analytics.sink: expected \"sqlite\", found the string \"nats\""},
         MistakeCase{"ElementType", "[analytics]\nwanted = [\"a\", 1]",

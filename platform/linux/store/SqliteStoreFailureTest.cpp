@@ -28,6 +28,17 @@ class SqliteStoreFailureTest : public StoreTest {
       return counted("stored") > before;
     });
   }
+  // One record of every kind but events.
+  void addOneOfEachKind() {
+    const double now = platform.clock.currentDate().secondsSince1970;
+    const Dictionary payload{{"f", std::string(1000, 'x')}};
+    store->issueMetrics().add(
+        {.time = now, .metricID = 1, .message = std::vector<std::byte>(1000)});
+    store->powerEvents().add({.time = now, .eventName = "e", .payload = payload});
+    store->linkMessages().add(
+        {.time = now, .party = std::make_shared<LinkParty>(), .payload = payload});
+    store->snapshots().add({.time = now, .signature = payload, .path = "/s"});
+  }
   void expectBalance() {
     EXPECT_EQ(counted("received"), counted("stored") + dropped());
     EXPECT_THAT(payloads(), SizeIs(counted("stored")));
@@ -70,6 +81,39 @@ TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileTheDiskIsFullThenStoresA
   expectBalance();
   EXPECT_THAT(platform.log.texts(LogLevel::kDefault), Contains(HasSubstr("storing again")));
   EXPECT_THAT(rows(database(), "PRAGMA integrity_check"), ElementsAre("ok"));
+}
+
+// Every kind of record meets the full disk together with the others, and none loses what it cannot
+// account for.
+TEST_F(SqliteStoreFailureTest, RecordsOfEveryKindAreCountedWhileTheDiskIsFullAndStoredAgainLater) {
+  start();
+  const auto count = [this](std::string_view piece, std::string_view name) {
+    return platform.statistics.value(piece, name);
+  };
+  const RecordTable* tables[] = {&kIssueMetrics, &kPowerEvents, &kLinkMessages, &kSnapshots};
+  {
+    const FileSizeLimit limit(200'000);
+    for (int number = 0; number < 2000; ++number) addOneOfEachKind();
+    ASSERT_TRUE(allIsStored());
+  }
+  std::vector<std::uint64_t> before;
+  for (const auto* table : tables) {
+    EXPECT_GT(count(table->piece, "dropped: disk full"), 0U) << table->piece;
+    before.push_back(count(table->piece, "stored"));
+  }
+  EXPECT_TRUE(storesAgain());
+  addOneOfEachKind();
+  stop();
+
+  for (std::size_t kind = 0; kind < std::size(tables); ++kind) {
+    const std::string_view piece = tables[kind]->piece;
+    EXPECT_EQ(count(piece, "stored"), before[kind] + 1) << piece;
+    EXPECT_EQ(count(piece, "received"), count(piece, "stored") + count(piece, "dropped: disk full"))
+        << piece;
+    EXPECT_THAT(rows(database(), "SELECT count(*) FROM " + std::string(tables[kind]->records)),
+                ElementsAre(std::to_string(count(piece, "stored"))))
+        << piece;
+  }
 }
 
 TEST_F(SqliteStoreFailureTest, LogsAtMostOneErrorLineASecond) {
