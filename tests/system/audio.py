@@ -70,8 +70,9 @@ class Audio:
         return path
 
     def run(self, *command):
-        return subprocess.Popen(command, env=self.environment, stdin=subprocess.DEVNULL,
-                                stdout=subprocess.DEVNULL)
+        # In the scratch directory: pw-profiler leaves plots where it runs.
+        return subprocess.Popen(command, env=self.environment, cwd=self.directory,
+                                stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL)
 
     def play(self, seconds, volume=0.5, role="Music"):
         return self.run("pw-play", "--volume", str(volume), "--media-role", role, self.tone(seconds))
