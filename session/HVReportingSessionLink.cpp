@@ -103,11 +103,16 @@ HVReportingSession::tlmreportingBackendSemaphore() {
   return backendSemaphore_;
 }
 
+// A start that waits behind slow ones keeps the configuration of its moment, so it is charged as
+// messages are: starting and stopping again and again takes no more than a client may hold.
 void HVReportingSession::submitLinkStart() {
+  LinkStart start{serviceType(), serviceName(), configuration()};
+  const std::size_t bytes = kWaitingOverhead + start.configuration.memorySize();
+  charge(0, bytes);
   tlmReportingQueue()->async(JobWeight::kMayBlock,
-                             [session = shared_from_this(),
-                              start = LinkStart{serviceType(), serviceName(), configuration()}] {
+                             [session = shared_from_this(), start = std::move(start), bytes] {
                                session->startLink(start);
+                               session->charge(bytes, 0);
                              });
 }
 
@@ -166,8 +171,11 @@ void HVReportingSession::dropLink() {
 }
 
 void HVReportingSession::submitLinkStop() {
-  tlmReportingQueue()->async(JobWeight::kMayBlock,
-                             [session = shared_from_this()] { session->stopLink(); });
+  charge(0, kWaitingOverhead);
+  tlmReportingQueue()->async(JobWeight::kMayBlock, [session = shared_from_this()] {
+    session->stopLink();
+    session->charge(kWaitingOverhead, 0);
+  });
 }
 
 void HVReportingSession::stopLink() {

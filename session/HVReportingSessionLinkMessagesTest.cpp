@@ -180,6 +180,24 @@ TEST_F(HVReportingSessionLinkMessagesTest, EveryMessageIsAccountedFor) {
                            Pair("dropped: no back-end", 2U)));
 }
 
+TEST_F(HVReportingSessionLinkMessagesTest, WaitingStartsAndStopsAreChargedWithTheirConfiguration) {
+  const auto account = std::make_shared<ResourceAccount>();
+  session_->chargeTo(account);
+  holdDiscoveries();
+  start();
+
+  for (int count = 0; count < 10; ++count) {
+    session_->updateConfigurationWithContentsOfConfiguration({{"a", std::string(10'000, 'x')}});
+    session_->stop();
+    session_->start();
+  }
+  EXPECT_GE(account->use().bytes, std::size_t{10} * 10'000);
+
+  session_->stop();
+  for (int count = 0; count < 11; ++count) platform_.dispatch.advance(9s);
+  EXPECT_EQ(account->use().bytes, session_->configuration().memorySize());
+}
+
 TEST_F(HVReportingSessionLinkMessagesTest, WhatWaitsIsChargedToTheClientUntilItWasSent) {
   const auto account = std::make_shared<ResourceAccount>();
   session_->chargeTo(account);
