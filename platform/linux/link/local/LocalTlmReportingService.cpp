@@ -9,12 +9,21 @@ namespace {
 constexpr const char* kBackendName = "local";
 constexpr const char* kErrorDomain = "com.tarno.halvox.link";
 constexpr std::int64_t kStoreClosed = 1;
+constexpr std::size_t kLongestName = 255;
 
-// A client's configuration can put any value in the place of a name.
-std::string textOf(const Dictionary& info, std::string_view key) {
+bool continuesCharacter(char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U; }
+
+// A client's configuration can put any value in the place of a name. Names are stored with every
+// message, so what is too long for a name is cut off between characters: else small messages could
+// fill the store and keep it busy.
+std::string nameOf(const Dictionary& info, std::string_view key) {
   const Value* const value = info.find(key);
   if (value == nullptr) return {};
-  return value->isString() ? std::string(value->string()) : describe(*value);
+  std::string name = value->isString() ? std::string(value->string()) : describe(*value);
+  if (name.size() <= kLongestName) return name;
+  std::size_t length = kLongestName;
+  while (length > 0 && continuesCharacter(name[length])) --length;
+  return name.substr(0, length);
 }
 
 std::shared_ptr<const LinkParty> partyOf(const Dictionary& sessionInfo,
@@ -22,8 +31,8 @@ std::shared_ptr<const LinkParty> partyOf(const Dictionary& sessionInfo,
   const Value* const id = sessionInfo.find(kTLMReportingSessionInfoSessionID);
   return std::make_shared<const LinkParty>(
       LinkParty{.sessionID = id == nullptr ? 0 : id->toInt64(),
-                .clientName = textOf(userInfo, kTLMReportingUserInfoClientName),
-                .serviceName = textOf(userInfo, kTLMReportingUserInfoServiceName)});
+                .clientName = nameOf(userInfo, kTLMReportingUserInfoClientName),
+                .serviceName = nameOf(userInfo, kTLMReportingUserInfoServiceName)});
 }
 
 }  // namespace

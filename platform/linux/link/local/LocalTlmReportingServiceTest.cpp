@@ -89,6 +89,18 @@ TEST_F(LocalTlmReportingServiceTest, NameThatIsNoTextIsStoredAsItsDescription) {
   EXPECT_THAT(stored("session_id, service_name"), ElementsAre("0|12"));
 }
 
+TEST_F(LocalTlmReportingServiceTest, NameThatIsTooLongIsCutBetweenCharacters) {
+  startLink();
+  const std::string end = "\u00E9";  // two bytes, the second of which is one too many
+  const auto session = link->TLMReportingCreateSession(
+      sessionInfo(1), userInfo(std::string(254, 'a') + end + std::string(1'000'000, 'b')));
+
+  ASSERT_TRUE(link->TLMReportingSendMessage(session, {1, 2, {}}).sent);
+  stop();
+
+  EXPECT_THAT(stored("service_name"), ElementsAre(std::string(254, 'a')));
+}
+
 TEST_F(LocalTlmReportingServiceTest, FlushIsDoneAtOnceAndLosesNothing) {
   startLink();
   const auto session = link->TLMReportingCreateSession(sessionInfo(1), userInfo("s"));
