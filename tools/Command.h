@@ -133,6 +133,19 @@ struct ShowSummaries {
   std::uint64_t last = 10;
 };
 
+// Traces by the service, and the results that they leave.
+struct RecordTrace {
+  std::string params{};                // the trace parameters file
+  std::vector<std::string> command{};  // the program and its arguments
+};
+struct ShowTrace {
+  std::string file{};
+};
+struct ExportTrace {
+  std::string file{};
+  std::string to{};
+};
+
 // The driver channels that there are.
 struct ShowDrivers {
   std::string group{};  // empty: all
@@ -148,7 +161,8 @@ struct CommonOptions {
 
 struct Command {
   std::variant<Request, RunScript, RunShell, ShowEvents, ShowSummaries, ShowRecords, Preferences,
-               PostNotification, ShowSnapshot, ExtractSnapshot, ShowDrivers>
+               PostNotification, ShowSnapshot, ExtractSnapshot, ShowDrivers, RecordTrace, ShowTrace,
+               ExportTrace>
       what;
   CommonOptions options;
 };

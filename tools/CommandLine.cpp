@@ -58,6 +58,7 @@ class CommandLineParser {
       addSummary();
       addRecords();
       addSnapshots();
+      addTrace();
       addSettings();
       addDrivers();
     } else {
@@ -158,6 +159,7 @@ class CommandLineParser {
   void addSummary();
   void addRecords();
   void addSnapshots();
+  void addTrace();
   void addSelection(CLI::App& app, const char* records, const char* names);
   static void addNumbers(CLI::App& app, const char* name, std::vector<std::int64_t>& numbers,
                          const char* description);
@@ -186,6 +188,8 @@ class CommandLineParser {
   RunScript script_;
   ShowEvents events_;
   ShowSummaries summaries_;
+  RecordTrace recordTrace_;
+  ExportTrace exportTrace_;
   ShowRecords records_;
   ExtractSnapshot snapshot_;
   Preferences preferences_;
@@ -414,15 +418,14 @@ void CommandLineParser::addRecords() {
 }
 
 void CommandLineParser::addSummary() {
-  auto& summary = addCommand("summary", "Show what sessions of internal builds came to",
-                             "halvoxctl summary --last 5",
-                             "A single FILE is shown with its messages.");
+  auto& summary =
+      addCommand("summary", "Show what sessions of internal builds came to",
+                 "halvoxctl summary --last 5", "A single FILE is shown with its messages.");
   auto* last = summary.add_option("--last", summaries_.last,
                                   "Without a FILE: so many, the newest (default: 10)");
   last->type_name("N")->check(CLI::NonNegativeNumber);
   summary
-      .add_option("FILE", summaries_.files,
-                  "Summary files (default: the newest of the service's)")
+      .add_option("FILE", summaries_.files, "Summary files (default: the newest of the service's)")
       ->excludes(last);
   onRun(summary, [this] { return summaries_; });
 }
@@ -531,6 +534,40 @@ void CommandLineParser::addSnapshots() {
       ->type_name("DIR");
   extract->add_flag("--force", snapshot_.force, "Replace files that are there");
   onRun(*extract, [this] { return snapshot_; });
+}
+
+void CommandLineParser::addTrace() {
+  auto& trace = addCommand("trace", "Have the service trace a program, or show its results",
+                           "halvoxctl trace record --params params.plist -- pw-play tone.wav");
+  trace.require_subcommand(1);
+  const auto addFor = [&](const char* name, const char* summary, const char* example) {
+    CLI::App* app = trace.add_subcommand(name, summary);
+    addConnectionOptions(*app);
+    app->footer(std::string("Example:\n  ") + example);
+    return app;
+  };
+  auto* record = addFor("record", "Trace while a program runs, then show what was measured",
+                        "halvoxctl trace record --params params.plist -- pw-play tone.wav");
+  record->add_option("--params", recordTrace_.params, "The trace parameters file, a property list")
+      ->type_name("FILE")
+      ->required();
+  record->add_option("COMMAND", recordTrace_.command, "The program and its arguments, behind --")
+      ->required();
+  onRun(*record, [this] { return recordTrace_; });
+
+  constexpr const char* kFile = "A results file of the service";
+  auto* show = addFor("show", "Show what a results file comes to",
+                      "halvoxctl trace show tracing_results.ssj");
+  show->add_option("FILE", exportTrace_.file, kFile)->required();
+  onRun(*show, [this] { return ShowTrace{exportTrace_.file}; });
+
+  auto* exporting = addFor("export", "Write the intervals for trace viewers",
+                           "halvoxctl trace export tracing_results.ssj --to trace.json");
+  exporting->add_option("FILE", exportTrace_.file, kFile)->required();
+  exporting->add_option("--to", exportTrace_.to, "The file to write")
+      ->type_name("FILE")
+      ->required();
+  onRun(*exporting, [this] { return exportTrace_; });
 }
 
 std::string CommandLineParser::helpOf(const CLI::App& app) {

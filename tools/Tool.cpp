@@ -16,6 +16,7 @@
 #include "tools/Script.h"
 #include "tools/SnapshotFiles.h"
 #include "tools/Summary.h"
+#include "tools/Traces.h"
 
 namespace halvox::tools {
 namespace {
@@ -63,6 +64,15 @@ ExitStatus runCommand(const Command& command, const ToolStreams& streams) {
   }
   if (const auto* extract = std::get_if<ExtractSnapshot>(&command.what)) {
     return extractSnapshot(*extract, form, streams.output, streams.errors);
+  }
+  if (const auto* record = std::get_if<RecordTrace>(&command.what)) {
+    return recordTrace(*record, options, streams.output, streams.errors);
+  }
+  if (const auto* trace = std::get_if<ShowTrace>(&command.what)) {
+    return showTrace(*trace, form, streams.output, streams.errors);
+  }
+  if (const auto* trace = std::get_if<ExportTrace>(&command.what)) {
+    return exportTrace(*trace, streams.errors);
   }
   if (const auto* records = std::get_if<ShowRecords>(&command.what)) {
     return showRecords(*records, form, streams.output, streams.outputDescriptor, streams.errors);

@@ -14,7 +14,7 @@ import subprocess
 import unittest
 from pathlib import Path
 
-from harness import BIN, DEADLINE, Service, WITH_US, require, wait_for
+from harness import BIN, CTL, DEADLINE, Service, WITH_US, require, wait_for
 
 CLIENT = BIN / "halvox_trace_client"
 NOBODY = 65534
@@ -240,6 +240,51 @@ class KernelTraceTest(unittest.TestCase):
             self.assertEqual(len(values["Shared"]), events // 2, service.log()[-2000:])
             self.assertLess(elapsed, 10)
             self.assertLess(peak / 1024, 300)
+
+
+class ToolTest(unittest.TestCase):
+    def run_tool(self, service, *arguments):
+        environment = {**service._environment, "HALVOX_SOCKET": str(service.socket),
+                       "LTTNG_UST_REGISTER_TIMEOUT": "10000"}
+        return subprocess.run([str(CTL), "trace", *map(str, arguments)], env=environment,
+                              capture_output=True, text=True, timeout=120, check=False)
+
+    def record(self, service, *command):
+        return self.run_tool(service, "record", "--json", "--params", service.params, "--", *command)
+
+    def test_program_is_traced_shown_and_exported(self):
+        with TracedService() as service:
+            done = self.record(service, CLIENT, "intervals", 5)
+            self.assertEqual(done.returncode, 0, done.stderr)
+            # The program's own line comes first.
+            measured, *lines = map(json.loads, done.stdout.splitlines())
+            rows = {row["name"]: row for row in lines}
+            self.assertEqual(rows["Shared"]["count"], THREADS * 5)
+            self.assertGreaterEqual(rows["Own3"]["min_ns"], min(measured["own"][3]))
+
+            file = next(service.directory.rglob("tracing_results.ssj"))
+            table = self.run_tool(service, "show", file)
+            self.assertEqual(table.returncode, 0, table.stderr)
+            self.assertIn("MEDIAN", table.stdout)
+            exported = service.directory / "trace.json"
+            self.assertEqual(self.run_tool(service, "export", file, "--to", exported).returncode, 0)
+            events = json.loads(exported.read_text())["traceEvents"]
+            self.assertEqual(sum(event["name"] == "Shared" and event["ph"] == "X"
+                                 for event in events), THREADS * 5)
+
+    def test_program_that_fails_is_told(self):
+        with TracedService() as service:
+            done = self.record(service, "false")
+
+            self.assertEqual(done.returncode, 1)
+            self.assertIn("false ended with status 1", done.stderr)
+
+    def test_service_that_does_not_trace_is_told(self):
+        with TracedService(switch="false") as service:
+            done = self.record(service, "true")
+
+            self.assertEqual(done.returncode, 1)
+            self.assertIn("left no new results", done.stderr)
 
 
 class PerformanceTraceTest(unittest.TestCase):

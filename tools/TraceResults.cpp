@@ -1,0 +1,134 @@
+#include "tools/TraceResults.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <cmath>
+#include <cstring>
+#include <fstream>
+
+#include <rapidjson/document.h>
+#include <rapidjson/istreamwrapper.h>
+#include <rapidjson/ostreamwrapper.h>
+#include <rapidjson/writer.h>
+
+namespace halvox::tools {
+namespace {
+
+using Writer = rapidjson::Writer<rapidjson::OStreamWrapper>;
+
+constexpr const char* kNoResults = "is no results file of a trace";
+constexpr double kNanosecondsPerMicrosecond = 1000;
+constexpr int kProcess = 1;
+
+std::string textOf(const rapidjson::Value& value) {
+  return {value.GetString(), value.GetStringLength()};
+}
+
+// Names a track; `track` 0 is the process itself.
+void writeName(Writer& json, int track, const std::string& name) {
+  json.StartObject();
+  json.Key("ph");
+  json.String("M");
+  json.Key("name");
+  json.String(track == 0 ? "process_name" : "thread_name");
+  json.Key("pid");
+  json.Int(kProcess);
+  json.Key("tid");
+  json.Int(track);
+  json.Key("args");
+  json.StartObject();
+  json.Key("name");
+  json.String(name.data(), static_cast<rapidjson::SizeType>(name.size()));
+  json.EndObject();
+  json.EndObject();
+}
+
+void writeInterval(Writer& json, int track, const std::string& name, double start, double length) {
+  json.StartObject();
+  json.Key("ph");
+  json.String("X");
+  json.Key("name");
+  json.String(name.data(), static_cast<rapidjson::SizeType>(name.size()));
+  json.Key("cat");
+  json.String("interval");
+  json.Key("pid");
+  json.Int(kProcess);
+  json.Key("tid");
+  json.Int(track);
+  json.Key("ts");
+  json.Double(start / kNanosecondsPerMicrosecond);
+  json.Key("dur");
+  json.Double(length / kNanosecondsPerMicrosecond);
+  json.EndObject();
+}
+
+}  // namespace
+
+std::variant<TraceResults, std::string> readTraceResults(const std::string& file) {
+  std::ifstream stream(file);
+  // A directory opens but cannot be read.
+  if (stream) (void)stream.peek();
+  if (stream.bad() || !stream.is_open()) return std::string(std::strerror(errno));
+  rapidjson::IStreamWrapper input(stream);
+  rapidjson::Document document;
+  constexpr unsigned kFlags = rapidjson::kParseFullPrecisionFlag |
+                              rapidjson::kParseValidateEncodingFlag |
+                              rapidjson::kParseIterativeFlag;
+  document.ParseStream<kFlags>(input);
+  if (document.HasParseError() || !document.IsObject()) return std::string(kNoResults);
+  const auto product = document.FindMember("product");
+  const auto unit = document.FindMember("unit");
+  const auto values = document.FindMember("values");
+  const auto end = document.MemberEnd();
+  if (product == end || !product->value.IsString() || unit == end || !unit->value.IsString() ||
+      textOf(unit->value) != "ns" || values == end || !values->value.IsObject()) {
+    return std::string(kNoResults);
+  }
+  TraceResults results{.product = textOf(product->value)};
+  for (const auto& member : values->value.GetObject()) {
+    if (!member.value.IsArray()) return std::string(kNoResults);
+    auto& numbers = results.values.emplace_back(textOf(member.name), std::vector<double>()).second;
+    for (const auto& value : member.value.GetArray()) {
+      if (value.IsNumber()) numbers.push_back(value.GetDouble());
+    }
+  }
+  return results;
+}
+
+TraceStatistics statisticsOf(std::vector<double> values) {
+  std::ranges::sort(values);
+  const auto atRank = [&](double share) {
+    const auto rank = static_cast<std::size_t>(std::ceil(share * double(values.size())));
+    return values[std::max<std::size_t>(rank, 1) - 1];
+  };
+  return {.count = values.size(),
+          .minimum = values.front(),
+          .median = atRank(0.5),
+          .percentile95 = atRank(0.95),
+          .maximum = values.back()};
+}
+
+void writeTraceEvents(const TraceResults& results, std::ostream& out) {
+  rapidjson::OStreamWrapper wrapped(out);
+  Writer json(wrapped);
+  json.StartObject();
+  json.Key("displayTimeUnit");
+  json.String("ns");
+  json.Key("traceEvents");
+  json.StartArray();
+  writeName(json, 0, results.product);
+  int track = 0;
+  for (const auto& [name, values] : results.values) {
+    writeName(json, ++track, name);
+    double start = 0;
+    for (const double value : values) {
+      writeInterval(json, track, name, start, value);
+      start += value;
+    }
+  }
+  json.EndArray();
+  json.EndObject();
+  out << '\n';
+}
+
+}  // namespace halvox::tools

@@ -1,0 +1,208 @@
+#include "tools/Traces.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <string>
+#include <utility>
+#include <variant>
+
+#include <spawn.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include "client/HalvoxClient.h"
+#include "client/Vocabulary.h"
+#include "platform/linux/runtime/Configuration.h"
+#include "tools/JsonText.h"
+#include "tools/TraceResults.h"
+
+namespace halvox::tools {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr const char* kPrefix = "halvoxctl trace: ";
+constexpr const char* kResultsFile =
+    "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Traces/tracing_results.ssj";
+constexpr ServiceType kTestService = 11;
+// The stop is answered when the trace has been read back.
+constexpr std::chrono::minutes kStopWithin{10};
+
+using Row = std::array<std::string, 6>;
+
+std::string microseconds(double nanoseconds) {
+  std::array<char, 64> text{};
+  std::snprintf(text.data(), text.size(), "%.3f", nanoseconds / 1000);
+  return text.data();
+}
+
+void printTable(const TraceResults& results, std::ostream& out) {
+  std::vector<Row> rows = {{"NAME", "COUNT", "MIN us", "MEDIAN us", "P95 us", "MAX us"}};
+  for (const auto& [name, values] : results.values) {
+    if (values.empty()) continue;
+    const TraceStatistics found = statisticsOf(values);
+    rows.push_back({harmlessText(name), std::to_string(found.count), microseconds(found.minimum),
+                    microseconds(found.median), microseconds(found.percentile95),
+                    microseconds(found.maximum)});
+  }
+  std::array<std::size_t, std::tuple_size_v<Row>> widths{};
+  for (const Row& row : rows) {
+    for (std::size_t column = 0; column < row.size(); ++column) {
+      widths[column] = std::max(widths[column], row[column].size());
+    }
+  }
+  for (const Row& row : rows) {
+    out << row[0] << std::string(widths[0] - row[0].size(), ' ');
+    for (std::size_t column = 1; column < row.size(); ++column) {
+      out << std::string(2 + widths[column] - row[column].size(), ' ') << row[column];
+    }
+    out << '\n';
+  }
+}
+
+void printJson(const TraceResults& results, std::ostream& out) {
+  for (const auto& [name, values] : results.values) {
+    if (values.empty()) continue;
+    const TraceStatistics found = statisticsOf(values);
+    out << toJson(Dictionary{{"name", name},
+                             {"count", static_cast<std::uint64_t>(found.count)},
+                             {"min_ns", found.minimum},
+                             {"median_ns", found.median},
+                             {"p95_ns", found.percentile95},
+                             {"max_ns", found.maximum}})
+        << '\n';
+  }
+}
+
+ExitStatus complain(std::ostream& errors, const std::string& what, ExitStatus status) {
+  errors << kPrefix << harmlessText(what) << '\n';
+  return status;
+}
+
+// Which file it is and when it was written; a new file is another one.
+std::pair<ino_t, std::int64_t> identityOf(const fs::path& file) {
+  struct stat status {};
+  if (::stat(file.c_str(), &status) != 0) return {};
+  return {status.st_ino, status.st_mtim.tv_sec * 1'000'000'000 + status.st_mtim.tv_nsec};
+}
+
+// A session of the service that is traced from its start to its stop.
+class TracedSession {
+ public:
+  explicit TracedSession(std::unique_ptr<client::HalvoxConnection> connection)
+      : connection_(std::move(connection)) {}
+
+  // Why it does not run; empty when it does.
+  std::string start(const std::string& params) {
+    const Dictionary configuration{{"HVReportingTraceType", "ktrace"},
+                                   {"HVReportingMeridelPlistFilePath", params}};
+    const auto failed = [](const auto& result) {
+      return result ? std::string() : result.failure->message;
+    };
+    std::string failure = failed(connection_->createReportingSession(id_));
+    if (failure.empty()) failure = failed(connection_->setServiceType(kTestService, id_));
+    if (failure.empty()) failure = failed(connection_->setConfiguration(configuration, id_));
+    if (failure.empty()) failure = failed(connection_->startReportingSessionForID(id_));
+    return failure;
+  }
+
+  // Returns when the results are written; why they may not be, or nothing.
+  std::string stop() {
+    const auto stopped = connection_->stopReportingSessionForID(id_);
+    if (!stopped) return stopped.failure->message;
+    const auto destroyed = connection_->destroyReportingSession(id_);
+    return destroyed ? std::string() : destroyed.failure->message;
+  }
+
+ private:
+  // Sessions are of their client, so the number need only be none of its other ones.
+  const ReporterID id_ = ::getpid();
+  const std::unique_ptr<client::HalvoxConnection> connection_;
+};
+
+// What is wrong with how the program ran; empty when nothing is.
+std::string runProgram(std::vector<std::string> command) {
+  std::vector<char*> arguments;
+  for (std::string& word : command) arguments.push_back(word.data());
+  arguments.push_back(nullptr);
+  pid_t pid = 0;
+  const int error = ::posix_spawnp(&pid, arguments[0], nullptr, nullptr, arguments.data(), environ);
+  if (error != 0) return "cannot run " + command[0] + ": " + std::strerror(error);
+  int status = 0;
+  while (::waitpid(pid, &status, 0) < 0 && errno == EINTR) {
+  }
+  if (WIFSIGNALED(status))
+    return command[0] + " was ended by signal " + std::to_string(WTERMSIG(status));
+  if (WEXITSTATUS(status) == 0) return {};
+  return command[0] + " ended with status " + std::to_string(WEXITSTATUS(status));
+}
+
+}  // namespace
+
+ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options, std::ostream& out,
+                       std::ostream& errors) {
+  auto loaded = platform::linux_::loadConfiguration();
+  if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
+    return complain(errors, error->description, ExitStatus::kBadConfiguration);
+  }
+  const fs::path results =
+      std::get<platform::linux_::Configuration>(loaded).storage.root / kResultsFile;
+  const std::string params = fs::absolute(request.params).string();
+  if (::access(params.c_str(), R_OK) != 0) {
+    return complain(errors, params + ": " + std::strerror(errno), ExitStatus::kBadArguments);
+  }
+  const auto before = identityOf(results);
+  auto opened = client::HalvoxConnection::open(
+      options.socket, std::max<std::chrono::milliseconds>(options.timeout, kStopWithin));
+  if (!opened) return complain(errors, opened.failure->message, ExitStatus::kNoService);
+  TracedSession session(std::move(*opened.value));
+  if (const std::string failure = session.start(params); !failure.empty()) {
+    return complain(errors, failure, ExitStatus::kRefused);
+  }
+  const std::string ofProgram = runProgram(request.command);
+  if (const std::string failure = session.stop(); !failure.empty()) {
+    return complain(errors, failure, ExitStatus::kRefused);
+  }
+  if (!ofProgram.empty()) complain(errors, ofProgram, ExitStatus::kRefused);
+  if (identityOf(results) == before) {
+    return complain(errors,
+                    "the service left no new results in " + results.string() +
+                        "; it traces when Tracing is on in [features.Acoustat]",
+                    ExitStatus::kRefused);
+  }
+  const EventForm form = options.json ? EventForm::kJson : EventForm::kText;
+  const ExitStatus shown = showTrace({results.string()}, form, out, errors);
+  return ofProgram.empty() ? shown : ExitStatus::kRefused;
+}
+
+ExitStatus showTrace(const ShowTrace& request, EventForm form, std::ostream& out,
+                     std::ostream& errors) {
+  const auto read = readTraceResults(request.file);
+  if (const auto* error = std::get_if<std::string>(&read)) {
+    return complain(errors, request.file + ": " + *error, ExitStatus::kBadArguments);
+  }
+  const auto& results = std::get<TraceResults>(read);
+  form == EventForm::kJson ? printJson(results, out) : printTable(results, out);
+  return ExitStatus::kDone;
+}
+
+ExitStatus exportTrace(const ExportTrace& request, std::ostream& errors) {
+  const auto read = readTraceResults(request.file);
+  if (const auto* error = std::get_if<std::string>(&read)) {
+    return complain(errors, request.file + ": " + *error, ExitStatus::kBadArguments);
+  }
+  std::ofstream out(request.to);
+  if (out) writeTraceEvents(std::get<TraceResults>(read), out);
+  out.close();
+  if (out) return ExitStatus::kDone;
+  return complain(errors, request.to + ": " + std::strerror(errno), ExitStatus::kCannotWrite);
+}
+
+}  // namespace halvox::tools

@@ -1,0 +1,26 @@
+#pragma once
+
+#include <ostream>
+
+#include "tools/Command.h"
+#include "tools/Events.h"
+
+namespace halvox::tools {
+
+// Has the service trace while a program runs, and prints what was measured. The service must be one
+// whose configuration this is and trace at all. Fails when the program does, when the service
+// refuses and when it leaves no new results.
+ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options, std::ostream& out,
+                       std::ostream& errors);
+
+// Prints for each measurement of a results file how many values it has and which; as JSON, one
+// object a line.
+ExitStatus showTrace(const ShowTrace& request, EventForm form, std::ostream& out,
+                     std::ostream& errors);
+
+// Writes the intervals of a results file in the Trace Event form: a track for each measurement, on
+// which its intervals stand one behind the other, because results tell how long they took but not
+// when they were.
+ExitStatus exportTrace(const ExportTrace& request, std::ostream& errors);
+
+}  // namespace halvox::tools
