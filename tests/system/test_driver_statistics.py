@@ -100,13 +100,17 @@ class DriverStatisticsTest(unittest.TestCase):
         require("pw-profiler")
         self.wait_for_sink("idle", "suspended")
         self.start_session(1)
+        start = time.monotonic()
         length = self.cycle_length(self.play(SECONDS))
+        self.wait_for_sink("idle", "suspended")
+        # On a busy machine cycles are missed, and a playback takes longer than its sound.
+        longest = time.monotonic() - start
         self.wait_until_all_is_told()
         self.end_session(1)
 
         cycles = self.wait_for_statistics("Simple")[SINK + "Simple_cycles"]
-        expected = SECONDS / length
-        self.assertAlmostEqual(cycles, expected, delta=0.05 * expected)
+        self.assertGreaterEqual(cycles * length, 0.95 * SECONDS)
+        self.assertLessEqual(cycles * length, 1.05 * longest)
         self.check_histogram("busytime", cycles)
         self.check_histogram("waittime", cycles)
         self.check_state(cycles * length)
@@ -145,7 +149,8 @@ class DriverStatisticsTest(unittest.TestCase):
                       r"name:(\w+),transition:(\d+),residency:(\d+),duty_cycle:([\d.]+);", text)}
         transitions, residency, duty = states["running"]
         self.assertEqual(transitions, 1, text)
-        self.assertAlmostEqual(residency, seconds, delta=0.5, msg=text)
+        # The sink told its state and the profiler its cycles: two accounts of one time.
+        self.assertAlmostEqual(residency, seconds, delta=0.05 * seconds, msg=text)
         total = sum(state[1] for state in states.values())
         self.assertAlmostEqual(duty, residency / total, delta=0.01, msg=text)
         self.assertAlmostEqual(sum(state[2] for state in states.values()), 1, delta=0.01, msg=text)
