@@ -7,12 +7,14 @@
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
+#include <ctime>
 #include <exception>
 #include <filesystem>
 #include <functional>
 #include <stdexcept>
 #include <string>
 #include <thread>
+#include <utility>
 #include <vector>
 
 #include <arpa/inet.h>
@@ -37,16 +39,41 @@ using Statement = UniqueHandle<sqlite3_stmt*, sqlite3_finalize>;
 using StreamInfo = UniqueHandle<jsStreamInfo*, jsStreamInfo_Destroy>;
 
 constexpr const char* kStream = "HALVOX";
-constexpr std::int64_t kWindow = 64;     // requests without an answer, of the client
+constexpr std::int64_t kWindow = 256;    // requests without an answer, as our client library has
 constexpr std::int64_t kPending = 8192;  // messages without one, of the plain library
 constexpr std::int64_t kWarmUp = 2000;
 constexpr std::chrono::milliseconds kPoll{2};
 constexpr std::chrono::minutes kPatience{2};
 
-double perSecond(std::int64_t messages, Clock::time_point began) {
-  return static_cast<double>(messages) /
-         std::chrono::duration<double>(Clock::now() - began).count();
+struct Result {
+  double perSecond;
+  double cpuMicros;  // a message, of the process that publishes
+};
+
+std::chrono::nanoseconds ownCpu() {
+  timespec time{};
+  ::clock_gettime(CLOCK_PROCESS_CPUTIME_ID, &time);
+  return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
+
+// One measurement: from its making to result(), with the CPU time that `cpu` gives.
+class Stopwatch {
+ public:
+  using Cpu = std::function<std::chrono::nanoseconds()>;
+  explicit Stopwatch(Cpu cpu) : cpu_(std::move(cpu)), cpuBefore_(cpu_()), began_(Clock::now()) {}
+
+  [[nodiscard]] Result result(std::int64_t messages) const {
+    const std::chrono::duration<double> seconds = Clock::now() - began_;
+    const std::chrono::duration<double, std::micro> cpu = cpu_() - cpuBefore_;
+    const auto count = static_cast<double>(messages);
+    return {count / seconds.count(), cpu.count() / count};
+  }
+
+ private:
+  Cpu cpu_;
+  std::chrono::nanoseconds cpuBefore_;
+  Clock::time_point began_;
+};
 
 void waitUntil(const char* what, const std::function<bool()>& isTrue) {
   for (const auto end = Clock::now() + kPatience; !isTrue(); std::this_thread::sleep_for(kPoll)) {
@@ -107,7 +134,7 @@ class JetStream {
   }
 
   // Publishes `like` over and over, with identifiers as long as its own.
-  double publish(const NatsMessage& like, std::int64_t messages) {
+  Result publish(const NatsMessage& like, std::int64_t messages) {
     const char* id = nullptr;
     if (natsMsgHeader_Get(like.get(), "Nats-Msg-Id", &id) != NATS_OK) {
       throw std::runtime_error("a message without an identifier");
@@ -115,7 +142,7 @@ class JetStream {
     const auto width = static_cast<int>(std::string(id).size());
     jsPubOptions options;
     jsPubOptions_Init(&options);
-    const auto began = Clock::now();
+    const Stopwatch watch(ownCpu);
     for (std::int64_t number = 0; number < messages; ++number) {
       char text[64];
       std::snprintf(text, sizeof text, "%0*lld", width, static_cast<long long>(++published_));
@@ -131,7 +158,7 @@ class JetStream {
     if (js_PublishAsyncComplete(context_.get(), &options) != NATS_OK) {
       throw std::runtime_error("the plain library got no acknowledgements");
     }
-    return perSecond(messages, began);
+    return watch.result(messages);
   }
 
  private:
@@ -157,17 +184,17 @@ std::int64_t storedMessages(const std::string& path) {
 }
 
 // What one client gets through the service, counted by `stored`.
-double through(const Server& server, std::int64_t messages,
+Result through(const Server& server, std::int64_t messages,
                const std::function<std::int64_t()>& stored) {
   const MessageShape shape;
   const std::int64_t before = stored();
   const auto client = server.client(1);
   client->pipeline(kWarmUp, kWindow, shape);
   waitUntil("the first messages", [&] { return stored() >= before + kWarmUp; });
-  const auto began = Clock::now();
+  const Stopwatch watch([&server] { return server.process().cpuTime(); });
   client->pipeline(messages, kWindow, shape);
   waitUntil("the messages", [&] { return stored() >= before + kWarmUp + messages; });
-  return perSecond(messages, began);
+  return watch.result(messages);
 }
 
 struct Run {
@@ -176,12 +203,12 @@ struct Run {
   int rounds;
 };
 
-double toLocal(const Run& run, ServerKind kind) {
+Result toLocal(const Run& run, ServerKind kind) {
   const Server server(run.programs, kind);
   return through(server, run.messages, [&] { return storedMessages(server.database()); });
 }
 
-double toJetStream(const Run& run, ServerKind kind, const JetStream& stream) {
+Result toJetStream(const Run& run, ServerKind kind, const JetStream& stream) {
   const Server server(run.programs, kind,
                       "[link]\nbackend = \"nats\"\nservers = [\"" + stream.url() + "\"]\n");
   return through(server, run.messages, [&] { return stream.messages(); });
@@ -193,20 +220,27 @@ void compare(const Run& run) {
                                     "JetStream, no event wanted", "JetStream, both events stored",
                                     "plain library to JetStream"};
   JetStream stream;
-  std::vector<double> values[kRows];
+  std::vector<double> rates[kRows];
+  std::vector<double> costs[kRows];
+  const auto add = [&](std::size_t row, const Result& result) {
+    rates[row].push_back(result.perSecond);
+    costs[row].push_back(result.cpuMicros);
+  };
   for (int round = 0; round < run.rounds; ++round) {
-    values[0].push_back(toLocal(run, ServerKind::kUnwanted));
-    values[1].push_back(toLocal(run, ServerKind::kStored));
-    values[2].push_back(toJetStream(run, ServerKind::kUnwanted, stream));
-    values[3].push_back(toJetStream(run, ServerKind::kStored, stream));
-    values[4].push_back(stream.publish(stream.message(), run.messages));
+    add(0, toLocal(run, ServerKind::kUnwanted));
+    add(1, toLocal(run, ServerKind::kStored));
+    add(2, toJetStream(run, ServerKind::kUnwanted, stream));
+    add(3, toJetStream(run, ServerKind::kStored, stream));
+    add(4, stream.publish(stream.message(), run.messages));
   }
-  std::printf("%lld messages of %d bytes of JSON, median of %d rounds, messages a second:\n",
-              static_cast<long long>(run.messages), natsMsg_GetDataLength(stream.message().get()),
-              run.rounds);
+  std::printf(
+      "%lld messages of %d bytes of JSON, median of %d rounds, messages a second,\n"
+      "times those of the plain library, CPU time of the publishing process a message:\n",
+      static_cast<long long>(run.messages), natsMsg_GetDataLength(stream.message().get()),
+      run.rounds);
   for (std::size_t row = 0; row < kRows; ++row) {
-    std::printf("  %-30s %10.0f  %.2f\n", names[row], median(values[row]),
-                median(values[row]) / median(values[kRows - 1]));
+    std::printf("  %-30s %10.0f  %.2f %8.2f us\n", names[row], median(rates[row]),
+                median(rates[row]) / median(rates[kRows - 1]), median(costs[row]));
   }
 }
 
