@@ -110,6 +110,76 @@ TEST(CommandLineTest, EventsTakeFilters) {
   EXPECT_EQ(events.database, "d");
 }
 
+// What a command other than a request comes to.
+template <typename T>
+T runOf(const Words& words) {
+  const auto parsed = parse(words);
+  const auto* command = std::get_if<Command>(&parsed);
+  if (command == nullptr) {
+    ADD_FAILURE() << std::get<CommandLineText>(parsed).text;
+    return {};
+  }
+  return std::get<T>(command->what);
+}
+
+TEST(CommandLineTest, MetricsAreChosenByNumberAndTime) {
+  const auto metrics =
+      runOf<ShowRecords>({"metrics", "--id", "0x5B0003", "--id", "7", "--last", "5"});
+
+  EXPECT_EQ(metrics.kind, ShowRecords::Kind::kMetrics);
+  EXPECT_EQ(metrics.ids, (std::vector<std::int64_t>{0x5B0003, 7}));
+  EXPECT_EQ(metrics.selection.last, 5U);
+  EXPECT_NE(errorOf({"metrics", "--name", "a"}), "");
+}
+
+TEST(CommandLineTest, PowerEventsAreChosenByNameAndCategory) {
+  const auto power = runOf<ShowRecords>(
+      {"power", "--name", "Oxbow*", "--category", "28", "--since", "10", "--follow"});
+
+  EXPECT_EQ(power.kind, ShowRecords::Kind::kPower);
+  EXPECT_EQ(power.selection.names, std::vector<std::string>{"Oxbow*"});
+  EXPECT_EQ(power.categories, std::vector<std::int64_t>{28});
+  EXPECT_EQ(power.selection.since, 10.0);
+  EXPECT_TRUE(power.selection.follow);
+}
+
+TEST(CommandLineTest, LinkMessagesAreChosenBySessionServiceCategoryAndType) {
+  const auto link = runOf<ShowRecords>({"link", "--session", "-1", "--service", "music",
+                                        "--category", "3", "--type", "9", "--database", "d"});
+
+  EXPECT_EQ(link.kind, ShowRecords::Kind::kLink);
+  EXPECT_EQ(link.ids, std::vector<std::int64_t>{-1});
+  EXPECT_EQ(link.selection.names, std::vector<std::string>{"music"});
+  EXPECT_EQ(link.categories, std::vector<std::int64_t>{3});
+  EXPECT_EQ(link.types, std::vector<std::int64_t>{9});
+  EXPECT_EQ(link.selection.database, "d");
+  EXPECT_EQ(errorOf({"link", "--type", "x"}),
+            "halvoxctl link: --type: \"x\" is no number; expected a whole number");
+}
+
+TEST(CommandLineTest, SnapshotsOfThemselvesAreListed) {
+  const auto all = runOf<ShowRecords>({"snapshots"});
+  const auto last = runOf<ShowRecords>({"snapshots", "--last", "5", "--follow"});
+
+  EXPECT_EQ(all.kind, ShowRecords::Kind::kSnapshots);
+  EXPECT_EQ(all.selection.last, std::nullopt);
+  EXPECT_EQ(last.kind, ShowRecords::Kind::kSnapshots);
+  EXPECT_EQ(last.selection.last, 5U);
+  EXPECT_TRUE(last.selection.follow);
+}
+
+TEST(CommandLineTest, ASnapshotIsShownOrExtracted) {
+  const auto extract =
+      runOf<ExtractSnapshot>({"snapshots", "extract", "newest", "--to", "/d", "--force"});
+
+  EXPECT_EQ(runOf<ShowSnapshot>({"snapshots", "show", "newest"}).file, "newest");
+  EXPECT_EQ(extract.file, "newest");
+  EXPECT_EQ(extract.directory, "/d");
+  EXPECT_TRUE(extract.force);
+  EXPECT_EQ(errorOf({"snapshots", "show"}), "halvoxctl snapshots show: FILE is required");
+  EXPECT_NE(errorOf({"snapshots", "throw", "newest"}), "");
+}
+
 TEST(CommandLineTest, ErrorsNameTheCommandAndTheArgument) {
   EXPECT_EQ(errorOf({"create", "x"}),
             "halvoxctl create: ID: \"x\" is no reporter ID; expected a whole number of 64 bits, "
@@ -136,8 +206,11 @@ TEST(CommandLineTest, ArgumentsTooManyAreRefused) {
 }
 
 TEST(CommandLineTest, EveryCommandHasHelpWithAnExample) {
-  for (const char* command : {"create", "set-type", "type", "configure", "start", "send", "stop",
-                              "destroy", "valid", "list", "kill", "run", "shell", "events"}) {
+  for (const char* command :
+       {"create",  "set-type", "type",        "configure", "start", "send",
+        "stop",    "destroy",  "valid",       "list",      "kill",  "run",
+        "shell",   "events",   "metrics",     "power",     "link",  "snapshots",
+        "summary", "drivers",  "preferences", "notify"}) {
     const auto parsed = parse({command, "--help"});
     ASSERT_TRUE(std::holds_alternative<CommandLineText>(parsed)) << command;
     const auto& text = std::get<CommandLineText>(parsed);

@@ -1,4 +1,7 @@
 #include <array>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
 #include <string>
 #include <vector>
 
@@ -9,7 +12,10 @@
 #include <unistd.h>
 
 #include "client/TestService.h"
+#include "platform/fake/FakePlatform.h"
 #include "platform/linux/UniqueHandle.h"
+#include "platform/linux/diagnostics/SnapshotArchive.h"
+#include "platform/linux/store/SqliteStore.h"
 
 // The built program, run against a service that plays along.
 namespace halvox::tools {
@@ -146,6 +152,71 @@ TEST_F(HalvoxctlTest, TheShellGoesOnBehindMistakes) {
 
   EXPECT_EQ(outcome.status, 2);
   EXPECT_EQ(outcome.out, "7\n");
+}
+
+// A configuration whose storage has one capture, archive and record.
+class HalvoxctlSnapshotsTest : public testing::Test {
+ protected:
+  HalvoxctlSnapshotsTest() {
+    std::filesystem::create_directories(scratch_.path("state/snapshots"));
+    std::ofstream(scratch_.path("halvox.toml"))
+        << "[storage]\ndirectory = \"" << scratch_.path("state") << "\"\n";
+    setenv("HALVOX_CONFIG", scratch_.path("halvox.toml").c_str(), 1);
+    makeArchive();
+    storeRecord();
+  }
+  ~HalvoxctlSnapshotsTest() override { unsetenv("HALVOX_CONFIG"); }
+
+  void makeArchive() const {
+    platform::linux_::SnapshotArchive archive(archive_, 1'000'000);
+    EXPECT_FALSE(archive.open());
+    EXPECT_FALSE(archive.add("signature.json", R"({"Type":"haptics"})"));
+    EXPECT_FALSE(archive.add("manifest.json",
+                             R"({"version":1,"time":"2026-03-01T12:00:00Z","seconds":1,)"
+                             R"("items":[]})"));
+    EXPECT_FALSE(archive.finish());
+    archive.keep();
+  }
+  void storeRecord() const {
+    platform::FakePlatform platform;
+    platform::linux_::Backpressure backpressure;
+    platform::linux_::StoreOptions options;
+    options.directory = scratch_.path("state");
+    platform::linux_::SqliteStore store(options,
+                                        {platform.clock, platform.statistics, backpressure});
+    EXPECT_FALSE(store.open());
+    store.snapshots().add({.time = platform.clock.currentDate().secondsSince1970,
+                           .signature = {{"Type", "haptics"}},
+                           .path = archive_});
+  }
+
+  client::ScratchDirectory scratch_;
+  std::string archive_ = scratch_.path("state/snapshots/20260301T120000Z-haptics-Generic.tar.zst");
+};
+
+TEST_F(HalvoxctlSnapshotsTest, SnapshotsOfThemselvesAreListed) {
+  const auto outcome = runProgram({"snapshots"});
+
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_NE(outcome.out.find("  " + archive_ + "  Type=haptics\n"), std::string::npos)
+      << outcome.out;
+}
+
+TEST_F(HalvoxctlSnapshotsTest, ShowsTheNewest) {
+  const auto outcome = runProgram({"snapshots", "show", "newest"});
+
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_NE(outcome.out.find("taken 2026-03-01T12:00:00Z"), std::string::npos) << outcome.out;
+  EXPECT_NE(outcome.out.find("  Type  haptics\n"), std::string::npos) << outcome.out;
+}
+
+TEST_F(HalvoxctlSnapshotsTest, ExtractsAFile) {
+  const std::string to = scratch_.path("to");
+
+  EXPECT_EQ(runProgram({"snapshots", "extract", archive_, "--to", to}).status, 0);
+
+  EXPECT_TRUE(std::filesystem::exists(to + "/signature.json"));
+  EXPECT_TRUE(std::filesystem::exists(to + "/manifest.json"));
 }
 
 }  // namespace

@@ -76,9 +76,9 @@ std::optional<std::string> audioIssueAsJson(const std::string& bytes) {
     }
   }
   if (reader.hasError()) return std::nullopt;
-  std::string json = "{\"issue_type\":" + tools::quoted(texts[0]) + ",\"node\":" + tools::quoted(texts[1]) +
-                     ",\"rtaid_client\":" + tools::quoted(texts[2]) +
-                     ",\"duration\":" + std::to_string(duration);
+  std::string json =
+      "{\"issue_type\":" + tools::quoted(texts[0]) + ",\"node\":" + tools::quoted(texts[1]) +
+      ",\"rtaid_client\":" + tools::quoted(texts[2]) + ",\"duration\":" + std::to_string(duration);
   if (timestamp) json += ",\"timestamp\":" + std::to_string(*timestamp);
   return json + "}";
 }
