@@ -8,6 +8,7 @@
 
 #include "platform/linux/runtime/Utf8.h"
 #include "platform/linux/settings/SettingNames.h"
+#include "platform/linux/settings/TomlNesting.h"
 #include "platform/linux/settings/TomlValues.h"
 
 namespace halvox::platform::linux_ {
@@ -159,7 +160,7 @@ std::string withNewLine(std::string_view text, std::size_t place, const std::str
 std::variant<PreferenceValue, PreferenceFileError> parsePreferenceValue(std::string_view text,
                                                                         ValueForm form) {
   if (!isUtf8(text)) return PreferenceFileError{"VALUE: expected UTF-8 text, found other bytes"};
-  if (form == ValueForm::kTomlOrString) {
+  if (form == ValueForm::kTomlOrString && !isNestedTooDeep(text)) {
     constexpr std::string_view kKey = "v = ";
     const std::string line = std::string(kKey) + std::string(text);
     const toml::parse_result parsed = toml::parse(line);

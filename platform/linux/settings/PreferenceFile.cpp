@@ -12,6 +12,7 @@
 #include "platform/linux/UniqueHandle.h"
 #include "platform/linux/runtime/Utf8.h"
 #include "platform/linux/settings/SettingNames.h"
+#include "platform/linux/settings/TomlNesting.h"
 #include "platform/linux/settings/TomlValues.h"
 
 namespace halvox::platform::linux_ {
@@ -37,16 +38,7 @@ PreferenceFileError tooLarge(const std::filesystem::path& file, std::size_t size
                            (size == 0 ? std::string("more") : std::to_string(size)));
 }
 
-}  // namespace
-
-std::optional<std::filesystem::path> preferencePath(const std::filesystem::path& directory,
-                                                    std::string_view user,
-                                                    std::string_view domain) {
-  if (!isUsableName(user) || !isUsableName(domain)) return std::nullopt;
-  return directory / user / (std::string(domain) + ".toml");
-}
-
-std::variant<std::optional<PreferenceText>, PreferenceFileError> readPreferenceText(
+std::variant<std::optional<PreferenceText>, PreferenceFileError> readText(
     const std::filesystem::path& file) {
   // Opening does not block, so that a pipe nobody writes to cannot hold anybody up.
   const UniqueFd descriptor(::open(file.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
@@ -70,6 +62,26 @@ std::variant<std::optional<PreferenceText>, PreferenceFileError> readPreferenceT
     content.text.append(buffer.data(), static_cast<std::size_t>(count));
   }
   return tooLarge(file, 0);  // it grew meanwhile
+}
+
+}  // namespace
+
+std::optional<std::filesystem::path> preferencePath(const std::filesystem::path& directory,
+                                                    std::string_view user,
+                                                    std::string_view domain) {
+  if (!isUsableName(user) || !isUsableName(domain)) return std::nullopt;
+  return directory / user / (std::string(domain) + ".toml");
+}
+
+std::variant<std::optional<PreferenceText>, PreferenceFileError> readPreferenceText(
+    const std::filesystem::path& file) {
+  auto content = readText(file);
+  const auto* text = std::get_if<std::optional<PreferenceText>>(&content);
+  if (text != nullptr && text->has_value() && isNestedTooDeep((*text)->text)) {
+    return problem(file, ": expected at most " + std::to_string(kDeepestNesting) +
+                             " levels of tables and arrays, found more");
+  }
+  return content;
 }
 
 std::variant<Dictionary, PreferenceFileError> parsePreferences(std::string_view text,

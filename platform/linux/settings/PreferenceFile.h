@@ -34,8 +34,8 @@ struct PreferenceText {
 std::optional<std::filesystem::path> preferencePath(const std::filesystem::path& directory,
                                                     std::string_view user, std::string_view domain);
 
-// The text of a file; none when there is no such file. Reads regular files of limited size only and
-// never waits for a writer.
+// The text of a file; none when there is no such file. Reads regular files of limited size and
+// nesting only and never waits for a writer.
 std::variant<std::optional<PreferenceText>, PreferenceFileError> readPreferenceText(
     const std::filesystem::path& file);
 

@@ -180,7 +180,19 @@ TEST_F(TomlPreferenceServiceTest, DeeplyNestedValuesAreAMistakeNotAnEnd) {
   store("key = " + std::string(100'000, '[') + std::string(100'000, ']'));
 
   EXPECT_EQ(at("key"), std::nullopt);
-  EXPECT_EQ(linesWith("expected TOML, found a mistake"), 1U);
+  EXPECT_EQ(linesWith("expected at most 256 levels of tables and arrays, found more"), 1U);
+}
+
+TEST_F(TomlPreferenceServiceTest, KeysOfManyWordsAreAMistakeNotAnEnd) {
+  std::string key = "a";
+  for (int count = 0; count < 200'000; ++count) key += ".a";
+  store(key + " = 1\n");
+  EXPECT_EQ(at("a"), std::nullopt);
+  EXPECT_EQ(linesWith("expected at most 256 levels of tables and arrays, found more"), 1U);
+
+  store("[" + key + "]\n");
+  EXPECT_EQ(at("a"), std::nullopt);
+  EXPECT_EQ(linesWith("expected at most 256 levels of tables and arrays, found more"), 2U);
 }
 
 TEST_F(TomlPreferenceServiceTest, EveryQuestionIsAccountedFor) {
