@@ -44,6 +44,11 @@ class Walk {
   explicit Walk(const fs::path& snapshot) : snapshot_(snapshot), reader_(archive_read_new()) {}
 
   [[nodiscard]] Failure open() {
+    // A pipe could keep us waiting for ever.
+    struct stat status {};
+    if (::stat(snapshot_.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
+      return failed(snapshot_, S_ISDIR(status.st_mode) ? errorText(EISDIR) : "it is no file");
+    }
     archive_read_support_format_tar(reader_.get());
     archive_read_support_filter_zstd(reader_.get());
     if (archive_read_open_filename(reader_.get(), snapshot_.c_str(), kBlock) == ARCHIVE_OK) {
@@ -60,6 +65,9 @@ class Walk {
     if (result == ARCHIVE_EOF) return nullptr;
     if (result != ARCHIVE_OK) return failed(snapshot_, textOf(reader_.get()));
     if (++entries_ > kMostEntries) return failed(snapshot_, "it has too many files");
+    // What is passed over is unpacked too, so the sizes count before anything is.
+    announced_ += std::min(static_cast<std::uint64_t>(archive_entry_size(entry)), kMostBytes + 1);
+    if (announced_ > kMostBytes) return failed(snapshot_, "it is too large when unpacked");
     const char* name = archive_entry_pathname(entry);
     const auto type = archive_entry_filetype(entry);
     if (name == nullptr || archive_entry_hardlink(entry) != nullptr ||
@@ -88,6 +96,7 @@ class Walk {
   Reader reader_;
   std::array<char, kBlock> buffer_{};
   std::size_t entries_ = 0;
+  std::uint64_t announced_ = 0;  // by the headers
   std::uint64_t bytes_ = 0;
 };
 

@@ -1,5 +1,7 @@
 #include "platform/linux/diagnostics/SnapshotReader.h"
 
+#include <sys/stat.h>
+
 #include "platform/linux/diagnostics/SnapshotTestSupport.h"
 
 namespace halvox::platform::linux_ {
@@ -93,6 +95,23 @@ TEST_F(SnapshotReaderTest, BrokenAndMissingArchivesAreNamed) {
   EXPECT_THAT(std::get<1>(broken).description, HasSubstr("a.tar.zst: "));
   ASSERT_EQ(missing.index(), 1U);
   EXPECT_THAT(std::get<1>(missing).description, HasSubstr("No such file or directory"));
+}
+
+TEST_F(SnapshotReaderTest, ArchiveThatIsTooLargeIsRefusedBeforeAnythingIsUnpacked) {
+  const std::string zeros(257U << 20U, '\0');
+
+  EXPECT_THAT(unpack({{"a", "1"}, {"zeros", zeros}}), HasSubstr("too large when unpacked"));
+  EXPECT_TRUE(std::filesystem::is_empty(target));
+  EXPECT_EQ(readSnapshotFiles(archive, {"a"}).index(), 1U);
+}
+
+TEST_F(SnapshotReaderTest, PipeInThePlaceOfAnArchiveKeepsNobodyWaiting) {
+  ASSERT_EQ(::mkfifo(archive.c_str(), 0600), 0);
+
+  const auto read = readSnapshotFiles(archive, {"a"});
+
+  ASSERT_EQ(read.index(), 1U);
+  EXPECT_THAT(std::get<1>(read).description, HasSubstr("it is no file"));
 }
 
 TEST_F(SnapshotReaderTest, TruncatedArchiveIsAnError) {
