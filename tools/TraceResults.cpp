@@ -76,16 +76,17 @@ std::variant<TraceResults, std::string> readTraceResults(const std::string& file
                               rapidjson::kParseIterativeFlag;
   document.ParseStream<kFlags>(input);
   if (document.HasParseError() || !document.IsObject()) return std::string(kNoResults);
-  const auto product = document.FindMember("product");
-  const auto unit = document.FindMember("unit");
-  const auto values = document.FindMember("values");
-  const auto end = document.MemberEnd();
-  if (product == end || !product->value.IsString() || unit == end || !unit->value.IsString() ||
-      textOf(unit->value) != "ns" || values == end || !values->value.IsObject()) {
+  const auto has = [&](const char* name) { return document.HasMember(name); };
+  if (!has("product") || !document["product"].IsString() || !has("unit") ||
+      !document["unit"].IsString() || textOf(document["unit"]) != "ns" || !has("values") ||
+      !document["values"].IsObject()) {
     return std::string(kNoResults);
   }
-  TraceResults results{.product = textOf(product->value)};
-  for (const auto& member : values->value.GetObject()) {
+  TraceResults results{.product = textOf(document["product"])};
+  const rapidjson::Value& values = document["values"];
+  const auto members = values.MemberBegin();
+  for (rapidjson::SizeType index = 0; index < values.MemberCount(); ++index) {
+    const auto& member = members[static_cast<std::ptrdiff_t>(index)];
     if (!member.value.IsArray()) return std::string(kNoResults);
     auto& numbers = results.values.emplace_back(textOf(member.name), std::vector<double>()).second;
     for (const auto& value : member.value.GetArray()) {

@@ -132,7 +132,8 @@ bool isStreamName(std::string_view text) {
 
 void readLinkTls(TableReader table, std::optional<Configuration::Link::Tls>& result) {
   if (!table.isPresent()) return;
-  Configuration::Link::Tls& tls = result.emplace();
+  // Not emplace(), which clang 14 finds no constructor for.
+  Configuration::Link::Tls& tls = *(result = Configuration::Link::Tls{});
   table.read("ca", tls.ca, kLongestPath);
   table.read("certificate", tls.certificate, kLongestPath);
   table.read("key", tls.key, kLongestPath);
