@@ -9,12 +9,27 @@ namespace {
 constexpr const char* kTooDeep = "is nested too deeply";
 constexpr const char* kTooLarge = "has too many values";
 constexpr const char* kNotXml = "is no XML property list";
+constexpr const char* kHasNul = "has a text with a NUL";
 constexpr const char* kNotBinary = "is no binary property list";
 
 using Reason = const char*;  // null: none
 
 std::size_t quotesIn(std::string_view text) {
   return static_cast<std::size_t>(std::ranges::count(text, '"'));
+}
+
+// The library ends the process when a key has one.
+bool hasNul(std::string_view text, bool isUtf16) {
+  if (!isUtf16) return text.find('\0') != std::string_view::npos;
+  for (std::size_t at = 0; at + 1 < text.size(); at += 2) {
+    if (text[at] == '\0' && text[at + 1] == '\0') return true;
+  }
+  return false;
+}
+
+bool hasNulInXml(std::string_view text) {
+  return hasNul(text, false) || text.find("&#0") != std::string_view::npos ||
+         text.find("&#x0") != std::string_view::npos;
 }
 
 // Counts the tags of an XML list. Whatever the library might see differently is refused or counted
@@ -26,6 +41,7 @@ class XmlShape {
       : text_(text), bounds_(bounds) {}
 
   Reason check() {
+    if (hasNulInXml(text_)) return kHasNul;
     for (;;) {
       const Reason reason = step();
       if (reason != kMore) return reason;
@@ -204,6 +220,9 @@ class BinaryShape {
     const std::uint64_t parts = kind == kUtf16 || kind == kDictionary ? count * 2 : count;
     const std::uint64_t size = isContainer ? parts * referenceSize_ : parts;
     if (size > bytes_.size() - at) return kNotBinary;
+    if (!isContainer && kind != kData && hasNul(bytes_.substr(at, size), kind == kUtf16)) {
+      return kHasNul;
+    }
     content = {.bytes = size, .references = isContainer ? parts : 0, .first = at};
     return nullptr;
   }
