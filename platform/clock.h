@@ -13,7 +13,7 @@ struct LocalTime {
   int day = 1;    // from 1
   int hour = 0;
   int minute = 0;
-  int second = 0;  // up to 60
+  int second = 0;                         // up to 60
   std::chrono::minutes offsetFromUTC{0};  // what was added to UTC
   friend bool operator==(const LocalTime&, const LocalTime&) = default;
 };

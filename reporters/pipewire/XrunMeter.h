@@ -14,8 +14,8 @@ class XrunMeter {
 
   static constexpr std::chrono::seconds kDistance{1};
 
-  // The stream missed the cycle of that time and length. PipeWire's profiler tells of a missed cycle
-  // twice, one right after the other; the second time does not count.
+  // The stream missed the cycle of that time and length. PipeWire's profiler tells of a missed
+  // cycle twice, one right after the other; the second time does not count.
   void add(Time cycle, Seconds lost);
   // What was lost since the last report, if there is any and a report is due. The clock may have
   // been set back: then one is.

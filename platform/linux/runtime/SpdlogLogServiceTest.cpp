@@ -87,9 +87,9 @@ TEST_F(SpdlogLogServiceTest, KeepsLinesInMemoryAtALevelOfTheirOwn) {
   MemoryLogSink& written = *sink;
   SpdlogLogService service({LogLevel::kError, LogLevel::kInfo}, std::move(sink), statistics_);
   LogCategory& category = service.createCategory("com.tarno.halvox", "hvrs");
-  for (const auto& [level, text] : {std::pair(LogLevel::kDebug, "too little"),
-                                    std::pair(LogLevel::kInfo, "kept"),
-                                    std::pair(LogLevel::kError, "kept and written")}) {
+  for (const auto& [level, text] :
+       {std::pair(LogLevel::kDebug, "too little"), std::pair(LogLevel::kInfo, "kept"),
+        std::pair(LogLevel::kError, "kept and written")}) {
     if (category.isEnabled(level)) category.write(level, text);
   }
   service.stop();

@@ -30,8 +30,8 @@ constexpr std::chrono::nanoseconds kStreamAge = std::chrono::hours(24 * 30);
 constexpr std::chrono::nanoseconds kDuplicatesTime = std::chrono::minutes(2);
 static_assert(kDuplicatesTime >= 2 * NatsLink::kAckTime);
 
-// The library shall keep nothing while the servers are away, see NatsLink. It does so with 0, unlike
-// what it says of itself; with 1 byte it keeps a whole message.
+// The library shall keep nothing while the servers are away, see NatsLink. It does so with 0,
+// unlike what it says of itself; with 1 byte it keeps a whole message.
 constexpr int kReconnectBufferBytes = 0;
 constexpr std::chrono::milliseconds kDrainTime{1000};
 
