@@ -22,6 +22,11 @@ constexpr UnitLog kLog(driversCategory, "PipewireConnection");
 // The first answer tells that all objects were announced, the second that all told their state.
 constexpr int kRoundTrips = 2;
 
+// A socket has its name before it takes connections, and a server that ends takes some to the last:
+// so a few attempts are made after one appeared or went.
+constexpr int kAttempts = 5;
+constexpr auto kPauseBetweenAttempts = std::chrono::milliseconds(200);
+
 std::string messageOf(int error) { return std::generic_category().message(error); }
 
 std::string_view lookUp(const spa_dict* properties, const char* key) {
@@ -89,12 +94,11 @@ class PipewireConnection::Node {
   pipewire::ObjectBinding binding_;
 };
 
-PipewireConnection::PipewireConnection(pw_loop* loop, SharedGraph& graph,
-                                       std::chrono::milliseconds retry)
+PipewireConnection::PipewireConnection(pw_loop* loop, SharedGraph& graph)
     : loop_(loop),
       graph_(graph),
-      retry_(retry),
-      timer_(pw_loop_add_timer(loop, &PipewireConnection::onTimer, this)) {
+      timer_(pw_loop_add_timer(loop, &PipewireConnection::onTimer, this)),
+      watch_(loop, [this] { serverAppeared(); }) {
   if (timer_ != nullptr) context_ = makeContext(loop);
   if (context_ == nullptr) kLog.error("cannot set up PipeWire's library: ", messageOf(errno));
 }
@@ -105,11 +109,13 @@ PipewireConnection::~PipewireConnection() {
 }
 
 void PipewireConnection::update() {
-  if (std::exchange(isLost_, false)) disconnect();
-  const bool isWanted = isLeased();
-  updateAfter(std::nullopt);
-  if (core_ == nullptr && (isWanted || !lastAttempt_.has_value())) connectWhenDue();
-  updateProfiler(isWanted);
+  attempts_ = std::max(attempts_, 1);
+  proceed();
+}
+
+void PipewireConnection::serverAppeared() {
+  attempts_ = kAttempts;
+  proceed();
 }
 
 bool PipewireConnection::isLeased() {
@@ -117,16 +123,33 @@ bool PipewireConnection::isLeased() {
   return !graph_.lease.expired();
 }
 
-void PipewireConnection::connectWhenDue() {
-  const Clock::time_point now = Clock::now();
-  if (!lastAttempt_.has_value() || now - *lastAttempt_ >= retry_) {
-    lastAttempt_ = now;
-    connect();
+void PipewireConnection::proceed() {
+  proceedAfter(std::nullopt);
+  const bool isWanted = isLeased();
+  if (std::exchange(isLost_, false)) {
+    disconnect();
+    if (isWanted) {
+      watch_.begin();
+      proceedAfter(kPauseBetweenAttempts);
+    }
+    return;
   }
-  if (core_ == nullptr && isLeased()) updateAfter(*lastAttempt_ + retry_ - now);
+  if (core_ == nullptr && (isWanted || !isTried_)) lookForServer();
+  if (core_ != nullptr || !isWanted) watch_.end();
+  updateProfiler(isWanted);
+}
+
+void PipewireConnection::lookForServer() {
+  // First, so that none appears unseen after the attempt.
+  watch_.begin();
+  if (attempts_ == 0) return;
+  --attempts_;
+  connect();
+  if (core_ == nullptr && attempts_ > 0) proceedAfter(kPauseBetweenAttempts);
 }
 
 void PipewireConnection::connect() {
+  isTried_ = true;
   core_.reset(pw_context_connect(
       context_.get(), pw_properties_new(PW_KEY_APP_NAME, "halvox-reportingd", nullptr), 0));
   if (core_ != nullptr) {
@@ -134,7 +157,7 @@ void PipewireConnection::connect() {
     return;
   }
   if (!std::exchange(isMissingTold_, true)) {
-    kLog.info("no PipeWire: ", messageOf(errno), "; it is looked for while sessions run");
+    kLog.info("no PipeWire: ", messageOf(errno), "; it is waited for while sessions run");
   }
   settle();
 }
@@ -169,7 +192,6 @@ void PipewireConnection::disconnect() {
   registry_.reset();
   spa_hook_remove(&coreHook_);
   core_.reset();
-  lastAttempt_ = Clock::now();
   settle();
   const MutexLock lock(graph_.mutex);
   graph_.statistics.serverLost();
@@ -183,7 +205,7 @@ void PipewireConnection::settle() {
   graph_.settled.notifyAll();
 }
 
-void PipewireConnection::updateAfter(std::optional<Clock::duration> pause) {
+void PipewireConnection::proceedAfter(std::optional<Clock::duration> pause) {
   timespec value{};
   if (pause.has_value()) {
     // Nothing would stop the timer.
@@ -218,7 +240,7 @@ void PipewireConnection::onProfile(const spa_pod* profile) {
 }
 
 void PipewireConnection::onTimer(void* data, std::uint64_t /*expirations*/) {
-  static_cast<PipewireConnection*>(data)->update();
+  static_cast<PipewireConnection*>(data)->proceed();
 }
 
 void PipewireConnection::onCoreInfo(void* data, const pw_core_info* info) {
@@ -226,6 +248,7 @@ void PipewireConnection::onCoreInfo(void* data, const pw_core_info* info) {
   // It is told again when the server's properties change.
   if (std::exchange(self->isReached_, true)) return;
   self->isMissingTold_ = false;
+  self->attempts_ = kAttempts;
   kLog.notice("following PipeWire ", info->version, " (", info->name, ")");
   const MutexLock lock(self->graph_.mutex);
   self->graph_.statistics.serverReached();
@@ -252,7 +275,7 @@ void PipewireConnection::onCoreError(void* data, std::uint32_t id, int /*sequenc
   if (std::exchange(self->isLost_, true)) return;
   kLog.notice("PipeWire has gone");
   // Later, because the connection cannot be closed from within its own callback.
-  self->updateAfter(Clock::duration::zero());
+  self->proceedAfter(Clock::duration::zero());
 }
 
 void PipewireConnection::onGlobal(void* data, std::uint32_t id, std::uint32_t /*permissions*/,

@@ -8,6 +8,7 @@
 
 #include <pipewire/pipewire.h>
 
+#include "platform/linux/drivers/pipewire/ServerWatch.h"
 #include "platform/linux/drivers/pipewire/SharedGraph.h"
 #include "platform/linux/pipewire/Handles.h"
 #include "platform/linux/pipewire/ObjectBinding.h"
@@ -16,19 +17,18 @@ namespace halvox::platform::linux_ {
 
 // Follows a PipeWire server and writes what it tells into the graph. All of it runs on the loop's
 // thread, except construction and destruction, while that thread does not run. Borrows loop and
-// graph. A server that goes or is not there is no error; it is looked for again as PipewireSource
-// says.
+// graph. A server that goes or is not there is no error; it is waited for as PipewireSource says.
 class PipewireConnection {
  public:
-  PipewireConnection(pw_loop* loop, SharedGraph& graph, std::chrono::milliseconds retry);
+  PipewireConnection(pw_loop* loop, SharedGraph& graph);
   ~PipewireConnection();
   PipewireConnection(const PipewireConnection&) = delete;
   PipewireConnection& operator=(const PipewireConnection&) = delete;
 
   // False when the library cannot be used at all, which is logged.
   [[nodiscard]] bool isUsable() const { return context_ != nullptr; }
-  // Connects, or binds or lets go of the profiler, as the graph's lease says. Never from within a
-  // callback of the server's objects, because it may destroy them.
+  // Connects or waits for the server, and binds or lets go of the profiler, as the graph's lease
+  // says. Never from within a callback of the server's objects, because it may destroy them.
   void update();
 
  private:
@@ -37,13 +37,16 @@ class PipewireConnection {
   class Node;
 
   [[nodiscard]] bool isLeased();
-  void connectWhenDue();
+  // Does what is due without asking for another attempt to connect.
+  void proceed();
+  void lookForServer();
   void connect();
   void listen();
   void disconnect();
   void settle();
-  // Has update() run after that time, or not any more.
-  void updateAfter(std::optional<Clock::duration> pause);
+  // Has proceed() run after that time, or not any more.
+  void proceedAfter(std::optional<Clock::duration> pause);
+  void serverAppeared();
   void updateProfiler(bool isWanted);
   void onProfile(const spa_pod* profile);
 
@@ -58,9 +61,10 @@ class PipewireConnection {
 
   pw_loop* const loop_;
   SharedGraph& graph_;
-  const Clock::duration retry_;
   spa_source* timer_ = nullptr;
-  std::optional<Clock::time_point> lastAttempt_;  // or when the server went
+  ServerWatch watch_;
+  int attempts_ = 0;  // to connect, that are left
+  bool isTried_ = false;
   bool isLost_ = false;
   bool isReached_ = false;
   bool isMissingTold_ = false;

@@ -104,7 +104,7 @@ class PipewireSource::Impl {
     loop_ = pw_thread_loop_new("halvox-pipewire", nullptr);
     if (loop_ == nullptr) return false;
     pw_loop* const loop = pw_thread_loop_get_loop(loop_);
-    connection_ = std::make_unique<PipewireConnection>(loop, graph_, options_.retry);
+    connection_ = std::make_unique<PipewireConnection>(loop, graph_);
     if (!connection_->isUsable()) return false;
     event_ = pw_loop_add_event(loop, &Impl::onRing, this);
     if (event_ == nullptr || pw_thread_loop_start(loop_) != 0) return false;

@@ -15,13 +15,13 @@ namespace halvox::platform::linux_ {
 // profiler, which tells of each cycle, is bound while somebody holds a reading, so a node's cycles
 // are those of such times; the first reading begins one.
 //
-// When there is no server, it is looked for whenever a reading is asked for and every `retry` as
-// long as somebody holds one, never more often; the same when the server goes. Until it is there,
-// the only channels are "connections", which count how often it was reached.
+// When there is no server, it is looked for when somebody begins to hold a reading, and met as soon
+// as its socket appears while somebody does; the same when the server goes. Nothing wakes up in the
+// meantime. Until it is there, the only channels are "connections", which count how often it was
+// reached.
 class PipewireSource final : public DriverSource {
  public:
   struct Options {
-    std::chrono::milliseconds retry{5000};
     // How long open() waits for what the server has.
     std::chrono::milliseconds longestOpening{800};
   };

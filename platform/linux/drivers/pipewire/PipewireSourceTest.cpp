@@ -1,6 +1,7 @@
 #include "platform/linux/drivers/pipewire/PipewireSource.h"
 
 #include <algorithm>
+#include <filesystem>
 #include <functional>
 #include <string>
 #include <thread>
@@ -107,7 +108,7 @@ class PipewireSourceTest : public ::testing::Test {
     }
     audio = std::make_unique<PrivatePipeWire>();
     ASSERT_TRUE(audio->isReady());
-    source = std::make_unique<PipewireSource>(PipewireSource::Options{.retry = 100ms});
+    source = std::make_unique<PipewireSource>();
     source->open();
   }
   void TearDown() override { source.reset(); }
@@ -181,6 +182,22 @@ TEST_F(PipewireSourceTest, ASourceHasItsChannelsInItsGroupAndLosesThemWhenItGoes
   }
 
   EXPECT_TRUE(waitUntil([&] { return valueOf(source->read(), kSource) == -1; }));
+}
+
+TEST_F(PipewireSourceTest, AServerThatAppearsWhileAReadingIsHeldIsFound) {
+  constexpr std::string_view kConnections = "pipewire/Speaker/PipeWire/connections";
+  const auto socket = audio->directory() / "run" / "pipewire-0";
+  const auto elsewhere = audio->directory() / "socket";
+  std::filesystem::rename(socket, elsewhere);
+  PipewireSource early;
+  early.open();
+  const auto held = early.read();
+  ASSERT_EQ(valueOf(held, kConnections), 0);
+
+  std::filesystem::rename(elsewhere, socket);
+
+  EXPECT_TRUE(waitUntil([&] { return valueOf(early.read(), kConnections) == 1; }));
+  EXPECT_TRUE(waitUntil([&] { return early.isProfiling(); }));
 }
 
 TEST_F(PipewireSourceTest, ARestartedServerIsFoundAgainAndCountedFromZero) {

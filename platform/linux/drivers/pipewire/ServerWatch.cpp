@@ -1,0 +1,97 @@
+#include "platform/linux/drivers/pipewire/ServerWatch.h"
+
+#include <array>
+#include <climits>
+#include <cstddef>
+#include <cstdlib>
+#include <filesystem>
+#include <utility>
+
+#include <sys/inotify.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr const char* kDefaultName = "pipewire-0";
+// Where the library looks for a server of the whole machine when the user has none.
+constexpr const char* kSystemDirectory = "/run/pipewire";
+
+std::string remoteName() {
+  const char* name = std::getenv("PIPEWIRE_REMOTE");
+  return name == nullptr || *name == '\0' ? kDefaultName : name;
+}
+
+std::vector<std::string> runtimeDirectories() {
+  for (const char* variable : {"PIPEWIRE_RUNTIME_DIR", "XDG_RUNTIME_DIR", "USERPROFILE"}) {
+    if (const char* directory = std::getenv(variable)) return {directory, kSystemDirectory};
+  }
+  return {kSystemDirectory};
+}
+
+}  // namespace
+
+ServerWatch::ServerWatch(pw_loop* loop, std::function<void()> onAppeared)
+    : loop_(loop), onAppeared_(std::move(onAppeared)) {
+  const std::filesystem::path remote = remoteName();
+  name_ = remote.filename();
+  for (const std::string& directory : runtimeDirectories()) {
+    // An absolute name needs no directory, and takes the place of any.
+    directories_.push_back((std::filesystem::path(directory) / remote).parent_path());
+  }
+}
+
+void ServerWatch::begin() {
+  if (source_ != nullptr) return;
+  inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
+  if (inotify_ && watchDirectories()) {
+    source_ =
+        pw_loop_add_io(loop_, inotify_.get(), SPA_IO_IN, false, &ServerWatch::onReadable, this);
+  }
+  if (source_ == nullptr) inotify_.reset();
+}
+
+void ServerWatch::end() {
+  if (source_ != nullptr) pw_loop_destroy_source(loop_, std::exchange(source_, nullptr));
+  inotify_.reset();
+}
+
+bool ServerWatch::watchDirectories() const {
+  bool isAny = false;
+  for (const std::string& directory : directories_) {
+    if (::inotify_add_watch(inotify_.get(), directory.c_str(),
+                            IN_CREATE | IN_MOVED_TO | IN_ONLYDIR) >= 0) {
+      isAny = true;
+    }
+  }
+  return isAny;
+}
+
+ServerWatch::News ServerWatch::takeNews() const {
+  News news;
+  alignas(inotify_event) std::array<std::byte, sizeof(inotify_event) + NAME_MAX + 1> buffer;
+  for (;;) {
+    const ssize_t size = ::read(inotify_.get(), buffer.data(), buffer.size());
+    if (size <= 0) return news;
+    for (std::size_t at = 0; at < static_cast<std::size_t>(size);) {
+      const auto* event = reinterpret_cast<const inotify_event*>(&buffer[at]);
+      // Events that were lost may have been those of the name.
+      if ((event->mask & IN_Q_OVERFLOW) != 0) news.hasAppeared = true;
+      if ((event->mask & IN_IGNORED) != 0) news.isDirectoryGone = true;
+      if (event->len > 0 && name_ == event->name) news.hasAppeared = true;
+      at += sizeof(inotify_event) + event->len;
+    }
+  }
+}
+
+void ServerWatch::onReadable(void* data, int /*descriptor*/, std::uint32_t /*mask*/) {
+  auto* self = static_cast<ServerWatch*>(data);
+  const News news = self->takeNews();
+  // What is left of the directories is watched on.
+  if (news.isDirectoryGone) {
+    self->end();
+    self->begin();
+  }
+  if (news.hasAppeared) self->onAppeared_();
+}
+
+}  // namespace halvox::platform::linux_

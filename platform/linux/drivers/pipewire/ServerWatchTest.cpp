@@ -1,0 +1,135 @@
+#include "platform/linux/drivers/pipewire/ServerWatch.h"
+
+#include <filesystem>
+#include <fstream>
+#include <memory>
+
+#include <gtest/gtest.h>
+#include <stdlib.h>
+
+#include "platform/linux/drivers/DriverTesting.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+struct LoopDeleter {
+  void operator()(pw_loop* loop) const {
+    pw_loop_leave(loop);
+    pw_loop_destroy(loop);
+    pw_deinit();
+  }
+};
+
+class ServerWatchTest : public ::testing::Test {
+ protected:
+  ServerWatchTest() {
+    setenv("XDG_RUNTIME_DIR", directory.path().c_str(), 1);
+    unsetenv("PIPEWIRE_RUNTIME_DIR");
+    unsetenv("PIPEWIRE_REMOTE");
+    pw_init(nullptr, nullptr);
+    loop.reset(pw_loop_new(nullptr));
+    pw_loop_enter(loop.get());
+  }
+  ~ServerWatchTest() override { unsetenv("PIPEWIRE_REMOTE"); }
+
+  // How often something was told of what has happened so far.
+  int told() {
+    while (pw_loop_iterate(loop.get(), 0) > 0) {
+    }
+    return told_;
+  }
+  [[nodiscard]] ServerWatch makeWatch() {
+    return {loop.get(), [this] { ++told_; }};
+  }
+  [[nodiscard]] std::filesystem::path inDirectory(std::string_view name) const {
+    return directory.path() / name;
+  }
+  static void create(const std::filesystem::path& path) { std::ofstream(path) << "."; }
+
+  const testing::TemporaryDirectory directory;
+  std::unique_ptr<pw_loop, LoopDeleter> loop;
+
+ private:
+  int told_ = 0;
+};
+
+TEST_F(ServerWatchTest, TellsOfTheSocketsNameAndOfNoOther) {
+  ServerWatch watch = makeWatch();
+  watch.begin();
+
+  create(inDirectory("pipewire-0.lock"));
+  EXPECT_EQ(told(), 0);
+  create(inDirectory("pipewire-0"));
+  EXPECT_EQ(told(), 1);
+}
+
+TEST_F(ServerWatchTest, TellsOfANameThatWasMovedIn) {
+  create(inDirectory("elsewhere"));
+  ServerWatch watch = makeWatch();
+  watch.begin();
+
+  std::filesystem::rename(inDirectory("elsewhere"), inDirectory("pipewire-0"));
+
+  EXPECT_EQ(told(), 1);
+}
+
+TEST_F(ServerWatchTest, AnAbsoluteNameIsWatchedWhereItIs) {
+  const testing::TemporaryDirectory other;
+  setenv("PIPEWIRE_REMOTE", (other.path() / "audio").c_str(), 1);
+  ServerWatch watch = makeWatch();
+  watch.begin();
+
+  create(inDirectory("audio"));
+  EXPECT_EQ(told(), 0);
+  create(other.path() / "audio");
+  EXPECT_GE(told(), 1);
+}
+
+TEST_F(ServerWatchTest, TellsNothingAfterItsEndAndAgainAfterAnotherBeginning) {
+  ServerWatch watch = makeWatch();
+  watch.begin();
+  watch.end();
+  create(inDirectory("pipewire-0"));
+  EXPECT_EQ(told(), 0);
+
+  std::filesystem::remove(inDirectory("pipewire-0"));
+  watch.begin();
+  create(inDirectory("pipewire-0"));
+  EXPECT_EQ(told(), 1);
+}
+
+TEST_F(ServerWatchTest, ADirectoryThatIsMissingIsFoundAtTheNextBeginning) {
+  setenv("XDG_RUNTIME_DIR", inDirectory("missing").c_str(), 1);
+  ServerWatch watch = makeWatch();
+  watch.begin();
+  std::filesystem::create_directory(inDirectory("missing"));
+  create(inDirectory("missing") / "other");
+  EXPECT_EQ(told(), 0);
+
+  watch.end();
+  watch.begin();
+  create(inDirectory("missing") / "pipewire-0");
+  EXPECT_EQ(told(), 1);
+}
+
+TEST_F(ServerWatchTest, ADirectoryThatGoesEndsItsWatchQuietly) {
+  const auto gone = inDirectory("gone");
+  std::filesystem::create_directory(gone);
+  setenv("XDG_RUNTIME_DIR", gone.c_str(), 1);
+  ServerWatch watch = makeWatch();
+  watch.begin();
+
+  std::filesystem::remove(gone);
+  EXPECT_EQ(told(), 0);
+  // Nothing is left that would wake the loop.
+  EXPECT_EQ(pw_loop_iterate(loop.get(), 0), 0);
+
+  std::filesystem::create_directory(gone);
+  watch.end();
+  watch.begin();
+  create(gone / "pipewire-0");
+  EXPECT_EQ(told(), 1);
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_
