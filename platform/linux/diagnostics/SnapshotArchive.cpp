@@ -22,17 +22,38 @@ constexpr mode_t kMode = 0600;
 
 }  // namespace
 
+// The library loses memory when writing fails, so to it writing never does: after an error its
+// bytes are discarded, and the error is looked at after each step.
 struct SnapshotArchive::Writer {
   UniqueFd file;
+  int error = 0;  // the first one
+  bool isDiscarding = false;
   UniqueHandle<struct archive*, archive_write_free> handle;
+
+  static la_ssize_t write(struct archive* /*handle*/, void* context, const void* bytes,
+                          std::size_t size) {
+    static_cast<Writer*>(context)->write({static_cast<const char*>(bytes), size});
+    return static_cast<la_ssize_t>(size);
+  }
+  void write(std::string_view bytes) {
+    while (!bytes.empty() && !isDiscarding) {
+      const ssize_t written = ::write(file.get(), bytes.data(), bytes.size());
+      if (written >= 0) {
+        bytes.remove_prefix(static_cast<std::size_t>(written));
+      } else if (errno != EINTR) {
+        error = errno;
+        isDiscarding = true;
+      }
+    }
+  }
 };
 
 SnapshotArchive::SnapshotArchive(std::filesystem::path temporaryPath, std::uint64_t mostBytes)
     : path_(std::move(temporaryPath)), writer_(std::make_unique<Writer>()), room_(mostBytes) {}
 
 SnapshotArchive::~SnapshotArchive() {
-  // Before the file goes: freeing an archive that is not finished writes its rest.
-  if (writer_->handle) archive_write_fail(writer_->handle.get());
+  // Freeing an archive that is not finished writes its rest.
+  writer_->isDiscarding = true;
   writer_->handle.reset();
   if (isCreated_ && !isKept_) ::unlink(path_.c_str());
 }
@@ -48,10 +69,10 @@ SnapshotArchive::Failure SnapshotArchive::open() {
   if (archive_write_set_format_pax_restricted(out) != ARCHIVE_OK ||
       archive_write_add_filter_zstd(out) != ARCHIVE_OK ||
       archive_write_set_bytes_in_last_block(out, 1) != ARCHIVE_OK ||
-      archive_write_open_fd(out, writer_->file.get()) != ARCHIVE_OK) {
+      archive_write_open(out, writer_.get(), nullptr, Writer::write, nullptr) != ARCHIVE_OK) {
     return failed();
   }
-  return std::nullopt;
+  return writeFailure();
 }
 
 SnapshotArchive::Failure SnapshotArchive::add(const std::string& name, std::string_view bytes) {
@@ -68,12 +89,13 @@ SnapshotArchive::Failure SnapshotArchive::add(const std::string& name, std::stri
     return failed();
   }
   room_ -= std::min<std::uint64_t>(room_, bytes.size());
-  return std::nullopt;
+  return writeFailure();
 }
 
 SnapshotArchive::Failure SnapshotArchive::finish() {
   if (archive_write_close(writer_->handle.get()) != ARCHIVE_OK) return failed();
   writer_->handle.reset();
+  if (Failure failure = writeFailure()) return failure;
   struct stat status {};
   if (::fsync(writer_->file.get()) != 0 || ::fstat(writer_->file.get(), &status) != 0) {
     return path_.native() + ": " + errorText(errno);
@@ -82,7 +104,13 @@ SnapshotArchive::Failure SnapshotArchive::finish() {
   return std::nullopt;
 }
 
+SnapshotArchive::Failure SnapshotArchive::writeFailure() const {
+  if (writer_->error == 0) return std::nullopt;
+  return path_.native() + ": " + errorText(writer_->error);
+}
+
 SnapshotArchive::Failure SnapshotArchive::failed() const {
+  if (Failure failure = writeFailure()) return failure;
   const int error = archive_errno(writer_->handle.get());
   const char* text = archive_error_string(writer_->handle.get());
   // The library's own numbers, which are no errno, are negative.

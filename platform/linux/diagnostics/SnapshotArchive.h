@@ -38,6 +38,9 @@ class SnapshotArchive {
  private:
   struct Writer;
 
+  // Why bytes did not reach the disk; none when they did.
+  [[nodiscard]] Failure writeFailure() const;
+  // Why the library did not take what it was given.
   [[nodiscard]] Failure failed() const;
 
   const std::filesystem::path path_;
