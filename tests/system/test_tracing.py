@@ -239,7 +239,9 @@ class KernelTraceTest(unittest.TestCase):
                   f"{peak / 1024:.0f} MiB at most", flush=True)
             self.assertEqual(len(values["Shared"]), events // 2, service.log()[-2000:])
             self.assertLess(elapsed, 10)
-            self.assertLess(peak / 1024, 300)
+            # Sanitizers keep freed memory for a while.
+            if not os.environ.get("HALVOX_SANITIZE"):
+                self.assertLess(peak / 1024, 300)
 
 
 class ToolTest(unittest.TestCase):
