@@ -229,7 +229,7 @@ void HVReportingDriverUtility::processHistogramData(const IOReportChannel& chann
   text += IOReportChannelGetUnitLabel(channel);
   text += "::";
   text += histogram.buckets;
-  driverStats.set(platform::Key(getDriverStatsKey(channel, kHistogramType)), std::move(text));
+  driverStats.set(platform::Key(getDriverStatsKey(channel, kHistogramType)), text);
 }
 
 void HVReportingDriverUtility::processStateData(const IOReportChannel& channel,
@@ -247,7 +247,7 @@ void HVReportingDriverUtility::processStateData(const IOReportChannel& channel,
   }
   kDriverLog.debug("the current reported data is : ", text);
   // Reported even when no state held at all.
-  driverStats.set(platform::Key(getDriverStatsKey(channel, kStateType)), std::move(text));
+  driverStats.set(platform::Key(getDriverStatsKey(channel, kStateType)), text);
 }
 
 std::string HVReportingDriverUtility::getDriverStatsKey(const IOReportChannel& channel,

@@ -120,7 +120,10 @@ std::variant<fs::path, SnapshotDirectory::Failure> SnapshotDirectory::publish(
   }
   int error = EEXIST;
   for (int number = first; error == EEXIST && number < first + kMostOfOneSecond; ++number) {
-    const fs::path to = path_ / (stamp + (number == 1 ? "" : "-" + std::to_string(number)) + rest);
+    std::string name = stamp;
+    if (number > 1) name.append("-").append(std::to_string(number));
+    name += rest;
+    const fs::path to = path_ / name;
     error = renameToFree(temporaryPath(), to);
     if (error != 0) continue;
     syncDirectory(path_);

@@ -16,7 +16,7 @@ void goOn(DispatchWaits::Wait wait, WaitOutcome outcome) {
 }  // namespace
 
 void DispatchWaits::begin(std::shared_ptr<SharedQueue> queue,
-                          std::shared_ptr<SharedSemaphore> semaphore,
+                          const std::shared_ptr<SharedSemaphore>& semaphore,
                           std::optional<std::chrono::nanoseconds> timeout, Then then) {
   Wait wait{std::move(queue), std::move(then), std::nullopt};
   std::optional<WaitOutcome> outcome;

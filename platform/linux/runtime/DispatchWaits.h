@@ -44,7 +44,7 @@ class DispatchWaits {
       : delayedJobs_(delayedJobs), runner_(runner) {}
 
   // The queue must run no job from now on until its resume() was called, which may happen within.
-  void begin(std::shared_ptr<SharedQueue> queue, std::shared_ptr<SharedSemaphore> semaphore,
+  void begin(std::shared_ptr<SharedQueue> queue, const std::shared_ptr<SharedSemaphore>& semaphore,
              std::optional<std::chrono::nanoseconds> timeout, Then then);
   // Ends the wait that began first, or keeps the signal.
   void signal(SharedSemaphore& semaphore);

@@ -31,7 +31,7 @@ void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
     if (isWaiting_) throw std::logic_error("a job began a second wait");
     isWaiting_ = true;
   }
-  pool_->waits().begin(shared_from_this(), std::move(shared), timeout, std::move(then));
+  pool_->waits().begin(shared_from_this(), shared, timeout, std::move(then));
 }
 
 void SharedQueue::resume(Job then) {

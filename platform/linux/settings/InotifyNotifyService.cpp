@@ -45,7 +45,7 @@ void drain(int descriptor) {
 
 }  // namespace
 
-InotifyNotifyService::InotifyNotifyService(std::filesystem::path directory,
+InotifyNotifyService::InotifyNotifyService(const std::filesystem::path& directory,
                                            const PreferenceReader& preferences,
                                            StatisticsService& statistics)
     : watch_({directory, preferences.directory() / kPreferenceUser}),

@@ -32,7 +32,7 @@ inline constexpr NotifyStatus kNotifyFailed = 1'000'000;
 class InotifyNotifyService final : public NotifyService {
  public:
   // Does not own the reader and the statistics, which must outlive it.
-  InotifyNotifyService(std::filesystem::path directory, const PreferenceReader& preferences,
+  InotifyNotifyService(const std::filesystem::path& directory, const PreferenceReader& preferences,
                        StatisticsService& statistics);
   InotifyNotifyService(const InotifyNotifyService&) = delete;
   InotifyNotifyService& operator=(const InotifyNotifyService&) = delete;

@@ -19,7 +19,7 @@ using PreferenceEdit = std::function<std::variant<std::string, PreferenceFileErr
 // takes the old file's place, with the same permissions. Makes the file and its directories when
 // they are missing. Others who change files of that directory in the same way wait, so that no
 // change is lost. A file that would stay as it is is not written. Gives what went wrong.
-std::optional<PreferenceFileError> changePreferenceFile(const std::filesystem::path& file,
+std::optional<PreferenceFileError> changePreferenceFile(const std::filesystem::path& named,
                                                         const PreferenceEdit& edit);
 
 }  // namespace halvox::platform::linux_

@@ -53,7 +53,7 @@ SettingBaseline WatchedSettings::look(const std::string& name) const {
   return baseline;
 }
 
-void WatchedSettings::add(const std::string& name, SettingBaseline baseline) {
+void WatchedSettings::add(const std::string& name, SettingBaseline&& baseline) {
   if (names_.known.emplace(name, NotifyFile{baseline.file}).second) names_.news.insert(name);
   for (auto& [domain, values] : baseline.domains) {
     if (domains_.known.emplace(domain, std::move(values)).second) domains_.news.insert(domain);

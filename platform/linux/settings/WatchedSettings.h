@@ -45,7 +45,7 @@ class WatchedSettings {
   // What a name's files are like now. Any thread may call.
   [[nodiscard]] SettingBaseline look(const std::string& name) const;
   // Watches a name from the state that `baseline` tells of; what has changed since is news.
-  void add(const std::string& name, SettingBaseline baseline);
+  void add(const std::string& name, SettingBaseline&& baseline);
 
   // A file in the notify directory was written, touched, created or moved there. That posts its
   // name even when the file is gone again, or looks as it did before.

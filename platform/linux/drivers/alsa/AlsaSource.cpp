@@ -78,7 +78,10 @@ void AlsaSource::readCard(int asound, const std::string& folder, Card card) {
   const UniqueFd directory = openDirectoryAt(asound, folder.c_str());
   if (!directory) return;
   for (const std::string& pcm : namesIn(directory.get())) {
-    if (pcm.starts_with("pcm")) readPcm(directory.get(), folder + '/' + pcm, pcm, card);
+    if (!pcm.starts_with("pcm")) continue;
+    std::string path = folder;
+    path.append("/").append(pcm);
+    readPcm(directory.get(), path, pcm, card);
   }
   readPower(folder, card);
 }
@@ -99,7 +102,9 @@ void AlsaSource::readPcm(int cardDirectory, const std::string& path, const std::
   pcm.group = isPlayback ? "Tx" : "Rx";
   pcm.subGroup = std::move(name);
   for (const std::string& substream : namesIn(directory.get())) {
-    readSubstream(directory.get(), path + '/' + substream, substream, pcm);
+    std::string place = path;
+    place.append("/").append(substream);
+    readSubstream(directory.get(), place, substream, pcm);
   }
 }
 

@@ -71,7 +71,7 @@ ChannelDescription describe(const MetricFamily& family, const MetricLabels& labe
     } else if (name == "unit") {
       channel.unitLabel = value;
     } else {
-      others += " " + name + "=" + value;
+      others.append(" ").append(name).append("=").append(value);
     }
   }
   *channel.channelName += others;

@@ -34,6 +34,7 @@ struct MetricLabel {
   std::string name;
   std::string value;
   friend bool operator==(const MetricLabel&, const MetricLabel&) = default;
+  // NOLINTNEXTLINE(modernize-use-nullptr): what the compiler makes of the operator
   friend auto operator<=>(const MetricLabel&, const MetricLabel&) = default;
 };
 using MetricLabels = std::vector<MetricLabel>;  // in the order of their names

@@ -129,7 +129,7 @@ void TextfileSource::readEntry(int directory, const std::string& file, Entry& en
   take(std::move(std::get<std::vector<MetricChannel>>(parsed)), entry);
 }
 
-void TextfileSource::take(std::vector<MetricChannel> channels, Entry& entry) {
+void TextfileSource::take(std::vector<MetricChannel>&& channels, Entry& entry) {
   std::map<std::string, Channel> known;
   for (const Channel& channel : entry.channels) known.emplace(fullName(*channel), channel);
   entry.channels.clear();

@@ -53,7 +53,7 @@ class TextfileSource final : public DriverSource {
   };
 
   void readEntry(int directory, const std::string& file, Entry& entry);
-  void take(std::vector<MetricChannel> channels, Entry& entry);
+  void take(std::vector<MetricChannel>&& channels, Entry& entry);
   void complain(const std::string& file, const std::string& what, Entry& entry);
   [[nodiscard]] std::vector<std::string> list(int directory);
   void chooseChannels();

@@ -39,7 +39,7 @@ class AckLedger {
   // flush is given up.
   FlushId flush(Done done) HALVOX_EXCLUDES(mutex_);
   // Ends the wait of a flush, if it still waits: what is unresolved counts as not acknowledged.
-  void giveUp(FlushId flush) HALVOX_EXCLUDES(mutex_);
+  void giveUp(FlushId id) HALVOX_EXCLUDES(mutex_);
 
  private:
   struct Account {

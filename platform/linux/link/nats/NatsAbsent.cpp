@@ -4,8 +4,10 @@ namespace halvox::platform::linux_ {
 
 bool isNatsBuilt() { return false; }
 
-std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(Configuration::Link,
-                                                       const NatsEnvironment&) {
+// Takes the settings by value as the real one does, which keeps them.
+// NOLINTNEXTLINE(performance-unnecessary-value-param)
+std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(Configuration::Link /*link*/,
+                                                       const NatsEnvironment& /*environment*/) {
   return nullptr;
 }
 

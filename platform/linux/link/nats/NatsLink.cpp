@@ -40,15 +40,14 @@ NatsLink::~NatsLink() { close(); }
 void NatsLink::discover(TLMReportingService::BackendsCallback found) {
   std::optional<Array> servers;
   std::uint64_t waiter = 0;
-  bool isRefused = false;
   {
     const MutexLock lock(mutex_);
-    isRefused = closeBy_.has_value();
+    const bool isRefused = closeBy_.has_value();
     if (!isRefused && isConnected_) {
       servers = servers_;
     } else if (!isRefused) {
       waiter = ++lastWaiter_;
-      waiters_.push_back({waiter, std::move(found)});
+      waiters_.push_back({waiter, found});
       wakeThread();
     }
   }

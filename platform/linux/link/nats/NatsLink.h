@@ -120,9 +120,10 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   void resolve(NatsMessage message, const jsPubAckErr* error) HALVOX_EXCLUDES(mutex_);
   void settle(const PendingAcks::Entry& entry, const jsPubAckErr* error) HALVOX_EXCLUDES(mutex_);
   void countFailure(std::uint64_t messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
-  void abandon(std::vector<PendingAcks::Entry> entries, std::string_view reason)
+  void abandon(const std::vector<PendingAcks::Entry>& entries, std::string_view reason)
       HALVOX_EXCLUDES(mutex_);
-  void fail(std::deque<OutgoingMessage> messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
+  void fail(const std::deque<OutgoingMessage>& messages, std::string_view reason)
+      HALVOX_EXCLUDES(mutex_);
 
   // The connection (NatsLinkConnection.cpp).
   void connect() HALVOX_EXCLUDES(mutex_);

@@ -196,7 +196,7 @@ void NatsLink::connect() {
     worthALine = attemptLog_.note(1, std::chrono::steady_clock::now());
   }
   if (worthALine) kLog.error("no server of the link was reached: ", failure);
-  fail(std::move(unsent), "no server");
+  fail(unsent, "no server");
   answerWaiters();
 }
 
@@ -233,8 +233,8 @@ void NatsLink::dropConnection() {
   if (connection) natsConnection_Close(connection.get());
   context.reset();
   connection.reset();
-  abandon(std::move(lost), "the connection ended");
-  fail(std::move(unsent), "the service ended");
+  abandon(lost, "the connection ended");
+  fail(unsent, "the service ended");
 }
 
 void NatsLink::onAvailable(natsConnection* connection) {

@@ -147,7 +147,7 @@ void NatsLink::giveUpOverdue() {
     const MutexLock lock(mutex_);
     overdue = pending_.takeOverdue(std::chrono::steady_clock::now());
   }
-  abandon(std::move(overdue), "no acknowledgement in time");
+  abandon(overdue, "no acknowledgement in time");
 }
 
 void NatsLink::onAcknowledged(jsCtx*, natsMsg* message, jsPubAck*, jsPubAckErr* error, void* link) {
@@ -200,7 +200,7 @@ void NatsLink::countFailure(std::uint64_t messages, std::string_view reason) {
   }
 }
 
-void NatsLink::abandon(std::vector<PendingAcks::Entry> entries, std::string_view reason) {
+void NatsLink::abandon(const std::vector<PendingAcks::Entry>& entries, std::string_view reason) {
   if (entries.empty()) return;
   notAcknowledged_.add(entries.size());
   countFailure(entries.size(), reason);
@@ -209,7 +209,7 @@ void NatsLink::abandon(std::vector<PendingAcks::Entry> entries, std::string_view
   }
 }
 
-void NatsLink::fail(std::deque<OutgoingMessage> messages, std::string_view reason) {
+void NatsLink::fail(const std::deque<OutgoingMessage>& messages, std::string_view reason) {
   if (messages.empty()) return;
   statistics_.counter(kNatsPiece, std::string("failed: ") + std::string(reason))
       .add(messages.size());

@@ -154,7 +154,8 @@ TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
   outgoing.ledger = session.ledger();
   if (outgoing.ledger) outgoing.number = outgoing.ledger->add();
   std::optional<Error> error = link_->send(std::move(outgoing));
-  return {.sent = !error, .error = std::move(error)};
+  const bool sent = !error.has_value();
+  return {.sent = sent, .error = std::move(error)};
 }
 
 void NatsTlmReportingService::TLMReportingFlushMessages(const Session& session,
