@@ -37,7 +37,7 @@ NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environme
 
 NatsLink::~NatsLink() { close(); }
 
-void NatsLink::discover(TLMReportingService::BackendsCallback found) {
+void NatsLink::discover(const TLMReportingService::BackendsCallback& found) {
   std::optional<Array> servers;
   std::uint64_t waiter = 0;
   {

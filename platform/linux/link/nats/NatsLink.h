@@ -74,7 +74,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   ~NatsLink();
 
   // Calls back once with the servers' addresses, or none.
-  void discover(TLMReportingService::BackendsCallback found) HALVOX_EXCLUDES(mutex_);
+  void discover(const TLMReportingService::BackendsCallback& found) HALVOX_EXCLUDES(mutex_);
   // Why no message is taken any more; it must not even be made then, as the library has ended.
   [[nodiscard]] std::optional<Error> refuseAtEnd() HALVOX_EXCLUDES(mutex_);
   // Takes the message, or says why not.

@@ -109,6 +109,7 @@ std::vector<std::string> LttngControl::sessionNames() {
   const int count = ::lttng_list_sessions(&sessions);
   const std::unique_ptr<lttng_session, decltype(&std::free)> owner(sessions, &std::free);
   std::vector<std::string> names;
+  if (count > 0) names.reserve(static_cast<std::size_t>(count));
   for (int index = 0; index < count; ++index) names.emplace_back(sessions[index].name);
   return names;
 }
