@@ -130,6 +130,7 @@ class TracedSession {
 // What is wrong with how the program ran; empty when nothing is.
 std::string runProgram(std::vector<std::string> command) {
   std::vector<char*> arguments;
+  arguments.reserve(command.size() + 1);
   for (std::string& word : command) arguments.push_back(word.data());
   arguments.push_back(nullptr);
   pid_t pid = 0;
