@@ -77,6 +77,7 @@ void print(const std::vector<std::int64_t>& values) {
 void intervals(int pairs) {
   std::array<std::vector<std::int64_t>, kThreads> measured;
   std::vector<std::thread> threads;
+  threads.reserve(kThreads);
   for (int thread = 0; thread < kThreads; ++thread) {
     threads.emplace_back(
         [&, thread] { measured[static_cast<std::size_t>(thread)] = measure(thread, pairs); });
