@@ -25,7 +25,8 @@ class OwnThreadQueue;
 // endHelping(). Brief jobs that it adds to a queue with an own thread then wake nobody; at the end
 // it carries them out itself, as long as no job that may block is in front of them and the queue's
 // own thread is not at work. A small batch so costs no change of threads. The order of jobs is kept
-// and never two of a queue run at once, whoever runs them.
+// and never two of a queue run at once, whoever runs them. Shared queues get the jobs of the
+// batch, and those that brief jobs add, at the end of it, so that the pool is woken once.
 class AsioDispatchService final : public DispatchService {
  public:
   // Both services must outlive this one and its queues. Throws std::system_error when the system

@@ -5,6 +5,7 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
+#include "platform/linux/runtime/BatchedTurns.h"
 #include "platform/linux/runtime/ThreadSetup.h"
 
 namespace halvox::platform::linux_ {
@@ -113,11 +114,22 @@ void OwnThreadQueue::work() {
     hasWorker_ = true;
     while (takeBatch()) {
       mutex_.unlock();
-      while (canGoOn()) runNext();
+      while (canGoOn()) runNextInBatch();
+      BatchedTurns::current().end();
       mutex_.lock();
     }
     hasWorker_ = false;
   }
+}
+
+void OwnThreadQueue::runNextInBatch() {
+  BatchedTurns& turns = BatchedTurns::current();
+  if (batch_[next_].weight == JobWeight::kBrief) {
+    turns.begin();
+  } else {
+    turns.end();
+  }
+  runNext();
 }
 
 // Destroys what was discarded in the middle of a batch, and tells that this was the last.
@@ -194,6 +206,11 @@ void OwnThreadQueue::runNext() {
   runner_->run(job);
 }
 
+void HelpingThread::begin() {
+  isActive_ = true;
+  turns_.begin();
+}
+
 HelpingThread& HelpingThread::current() {
   static thread_local HelpingThread thread;
   return thread;
@@ -207,6 +224,7 @@ void HelpingThread::end() {
   }
   queues_.clear();
   isActive_ = false;
+  turns_.end();
 }
 
 }  // namespace halvox::platform::linux_

@@ -14,6 +14,7 @@
 
 #include "platform/dispatch.h"
 #include "platform/linux/Mutex.h"
+#include "platform/linux/runtime/BatchedTurns.h"
 #include "platform/linux/runtime/JobRunner.h"
 
 namespace halvox::platform::linux_ {
@@ -78,6 +79,7 @@ class OwnThreadQueue final : public DispatchQueue,
   [[nodiscard]] bool takeWakeUp() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool canGoOn() const;
   void runNext();
+  void runNextInBatch();
 
   const std::string label_;
   const QualityOfService quality_;
@@ -116,13 +118,14 @@ class HelpingThread {
   static HelpingThread& current();
 
   [[nodiscard]] bool isActive() const { return isActive_; }
-  void begin() { isActive_ = true; }
+  void begin();
   // Helps each queue that was noted, in the order in which they were, those included that helped
   // jobs add to.
   void end();
   void note(std::shared_ptr<OwnThreadQueue> queue) { queues_.push_back(std::move(queue)); }
 
  private:
+  BatchedTurns& turns_ = BatchedTurns::current();  // made first, so that it goes last
   bool isActive_ = false;
   std::vector<std::shared_ptr<OwnThreadQueue>> queues_;
 };

@@ -5,6 +5,7 @@
 
 #include <asio/post.hpp>
 
+#include "platform/linux/runtime/BatchedTurns.h"
 #include "platform/linux/runtime/DispatchPool.h"
 
 namespace halvox::platform::linux_ {
@@ -17,7 +18,7 @@ void SharedQueue::async(JobWeight /*weight*/, Job job) {
     if (hasTurn_ || isWaiting_) return;
     hasTurn_ = true;
   }
-  beginTurn();
+  askForTurn();
 }
 
 void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
@@ -43,10 +44,17 @@ void SharedQueue::resume(Job then) {
     if (hasTurn_) return;
     hasTurn_ = true;
   }
+  askForTurn();
+}
+
+void SharedQueue::askForTurn() {
+  BatchedTurns& turns = BatchedTurns::current();
+  if (turns.isActive()) return turns.note(shared_from_this());
   beginTurn();
 }
 
 void SharedQueue::beginTurn() {
+  if (pool_->isStopped()) return discardJobs();
   asio::post(pool_->context(), [self = shared_from_this()] { self->runTurn(); });
 }
 

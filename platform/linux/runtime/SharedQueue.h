@@ -37,6 +37,8 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
 
   // Ends the wait: the queue goes on with this job, then with those that came meanwhile.
   void resume(Job then);
+  // Lets the pool run the jobs of the turn that is to come.
+  void beginTurn();
   // Discards and counts the jobs that wait. When the pool has stopped.
   void discardJobs();
 
@@ -44,7 +46,7 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
   // The jobs that one turn runs before other queues get theirs.
   static constexpr int kJobsPerTurn = 64;
 
-  void beginTurn();
+  void askForTurn();
   void runTurn();
   [[nodiscard]] bool runNext();
 
