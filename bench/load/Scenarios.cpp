@@ -89,10 +89,12 @@ double serverMicrosAfter(const LoadOptions& options,
 
 void measureThroughput(const LoadOptions& options, std::vector<Measurement>& results) {
   std::vector<Cost> echo;
+  std::vector<Cost> linked;
   std::vector<Cost> stored;
   std::vector<Cost> unwanted;
   for (int round = 0; round < options.rounds; ++round) {
     echo.push_back(oneRun(options, ServerKind::kEcho));
+    linked.push_back(oneRun(options, ServerKind::kLinked));
     stored.push_back(oneRun(options, ServerKind::kStored));
     unwanted.push_back(oneRun(options, ServerKind::kUnwanted));
   }
@@ -102,6 +104,8 @@ void measureThroughput(const LoadOptions& options, std::vector<Measurement>& res
     results.push_back(
         {name, unit, medianOf(costs, member), medianOf(echo, member), atMost, atLeast});
   };
+  add("throughput, events and link stored", "messages/s", linked, &Cost::messagesPerSecond, {}, {});
+  add("service CPU, events and link stored", "us/message", linked, &Cost::serverMicros, {}, {});
   add("throughput, both events stored", "messages/s", stored, &Cost::messagesPerSecond, {}, 0.55);
   add("service CPU, both events stored", "us/message", stored, &Cost::serverMicros, 1.9, {});
   add("client CPU, both events stored", "us/message", stored, &Cost::clientMicros, {}, {});

@@ -9,8 +9,12 @@
 
 namespace halvox::bench {
 
-// The echo, the service with both events of each message stored, the service with none wanted.
-enum class ServerKind : std::uint8_t { kEcho, kStored, kUnwanted };
+enum class ServerKind : std::uint8_t {
+  kEcho,
+  kLinked,    // the service that stores both events of each message and its message of the link
+  kStored,    // both events, no link
+  kUnwanted,  // neither
+};
 
 struct ServerPrograms {
   std::string service;
