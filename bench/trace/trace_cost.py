@@ -23,16 +23,17 @@ def main():
     home = tempfile.mkdtemp(prefix="halvox-trace-cost-")
     environment = {**os.environ, "HOME": home, "LTTNG_HOME": home}
 
-    def run(label):
-        done = subprocess.run([program], env=environment, capture_output=True, text=True, check=True)
-        print(f"{label}: {done.stdout.strip()}", flush=True)
+    def run(label, bursts, events):
+        done = subprocess.run([program, str(bursts), str(events)], env=environment,
+                              capture_output=True, text=True, check=True)
+        print(f"{label}:\n{done.stdout.rstrip()}", flush=True)
 
     def lttng(*arguments):
         subprocess.run(["lttng", "--no-sessiond", "-n", *arguments], env=environment, check=True,
                        stdout=subprocess.DEVNULL)
 
     try:
-        run("no trace runs")
+        run("no trace runs", 1000, 20_000)
         daemon = subprocess.Popen(["lttng-sessiond", "--no-kernel"], env=environment,
                                   stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
         try:
@@ -45,7 +46,7 @@ def main():
             for event in ("halvox:kdebug", "halvox_bare:kdebug"):
                 lttng("enable-event", "-u", "-c", "c", event, "--filter", FILTER)
             lttng("start")
-            run("a trace runs")
+            run("a trace runs", 400, 2_500)
             lttng("destroy")
         finally:
             daemon.terminate()
