@@ -149,6 +149,11 @@ TEST_F(HVReportingDriverChannelTest, FirstBucketWithoutBoundsHasZeroes) {
             "count=1,lower=0,upper=0,min=1,max=27,unit=ms::0-0:3");
 }
 
+TEST_F(HVReportingDriverChannelTest, HistogramNumbersAreSigned) {
+  EXPECT_EQ(histogram({{-20, -10, UINT64_MAX}}).begin()->value.string(),
+            "count=1,lower=-20,upper=0,min=1,max=27,unit=ms::-20--10:-1");
+}
+
 // --- State --------------------------------------------------------------------------------------
 
 TEST_F(HVReportingDriverChannelTest, StateChannelTellsTheStatesThatHeld) {

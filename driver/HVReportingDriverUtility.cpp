@@ -48,12 +48,10 @@ void logSampleError(const std::optional<IOReportError>& error) {
   if (error.has_value()) kDriverLog.error("IOReportCreateSamples error ", error->code);
 }
 
-IOReportService::Samples createSamples(const HVReportingIOChannelSubscription& subscription) {
-  std::optional<IOReportError> error;
-  auto samples = platform::ioReport().IOReportCreateSamples(
-      subscription.subscription(), subscription.subscribedChannels(), error);
-  if (samples == nullptr) logSampleError(error);
-  return samples;
+IOReportService::Samples createSamples(const HVReportingIOChannelSubscription& subscription,
+                                       std::optional<IOReportError>& error) {
+  return platform::ioReport().IOReportCreateSamples(subscription.subscription(),
+                                                    subscription.subscribedChannels(), error);
 }
 
 // The change since the snapshot, or null. A delta that fails is reported with the text of a sample
@@ -157,8 +155,11 @@ DriverSnapShot HVReportingDriverUtility::getSnapShot() const {
   for (const auto& subscription : ioChannelSubscriptions_) {
     std::string description = subscription.driver().description();
     kDriverLog.info("sampling driver ", description);
-    if (auto samples = createSamples(subscription)) {
+    std::optional<IOReportError> error;
+    if (auto samples = createSamples(subscription, error)) {
       snapShot.insert_or_assign(std::move(description), std::move(samples));
+    } else {
+      logSampleError(error);
     }
   }
   return snapShot;
@@ -170,8 +171,11 @@ void HVReportingDriverUtility::sendDriverLogsForSession(
   const auto snapShot = session->driverSnapShot();
   for (const auto& subscription : ioChannelSubscriptions_) {
     kDriverLog.info("getting latest samples");
-    const auto current = createSamples(subscription);
+    std::optional<IOReportError> error;
+    const auto current = createSamples(subscription, error);
     kDriverLog.info("done getting latest samples");
+    // Said after the sampling is, also of a session without a snapshot.
+    if (current == nullptr) logSampleError(error);
     if (current == nullptr || !snapShot.has_value()) continue;
     const auto delta = createDelta(*snapShot, subscription.driver().description(), current);
     if (delta == nullptr) continue;

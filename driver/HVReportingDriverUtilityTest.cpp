@@ -1,81 +1,19 @@
 #include "driver/HVReportingDriverUtility.h"
 
 #include <algorithm>
-#include <memory>
-#include <string>
-#include <vector>
 
 #include <gtest/gtest.h>
 
-#include "platform/fake/FakePlatform.h"
-#include "session/HVReportingSession.h"
+#include "driver/DriverUtilityTest.h"
 
 namespace halvox {
 namespace {
 
-using platform::Dictionary;
-using platform::FakeIOReportService;
+using namespace driver_testing;
+
 using platform::IOReportFormat;
 using platform::JournalKind;
-using platform::LogLevel;
-using Channel = FakeIOReportService::Channel;
-using Texts = std::vector<std::string>;
-
-constexpr const char* kGroups[] = {"TarnoQ7AMP-(null)",
-                                   "Speaker-(null)",
-                                   "(null)-MCA",
-                                   "Haptics-Stats",
-                                   "StateTransitionTimes_ms-(null)",
-                                   "Rx-(null)",
-                                   "Tx-(null)",
-                                   "(null)-IOSndFam2"};
-
-Channel simpleChannel(std::string name, std::int64_t value) {
-  return {.driverName = "Amp<1>",
-          .group = "Speaker",
-          .channelName = std::move(name),
-          .integerValue = value};
-}
-
-class HVReportingDriverUtilityTest : public testing::Test {
- protected:
-  HVReportingDriverUtilityTest() {
-    session_->setServiceType(AudioServiceType::kHaptics);
-    session_->start();
-    forgetWhatHappened();
-  }
-
-  // A sampler of the groups that there are now, as the service makes it at its start.
-  HVReportingDriverUtility makeUtility() {
-    HVReportingDriverUtility utility;
-    forgetWhatHappened();
-    return utility;
-  }
-  void forgetWhatHappened() {
-    platform_.journal.clear();
-    platform_.log.clear();
-    platform_.analytics.clear();
-  }
-  // The lines of the driver statistics.
-  Texts lines(LogLevel level) const {
-    Texts texts;
-    for (const auto& line : platform_.log.lines(level)) {
-      if (line.category == "hvrd") texts.push_back(line.text);
-    }
-    return texts;
-  }
-  // The messages that the session recorded.
-  std::vector<Dictionary> recorded() const {
-    std::vector<Dictionary> messages;
-    const auto history = session_->nestedAggregatedPayloadData();
-    for (const auto& entry : **history) messages.push_back(entry.message());
-    return messages;
-  }
-
-  platform::FakePlatform platform_;
-  std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
-      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
-};
+using HVReportingDriverUtilityTest = DriverUtilityTest;
 
 // --- Subscribing --------------------------------------------------------------------------------
 
@@ -141,94 +79,6 @@ TEST_F(HVReportingDriverUtilityTest, NoChannelsWithoutAnErrorSayNothing) {
   EXPECT_TRUE(lines(LogLevel::kError).empty());
 }
 
-// --- Failures at each position ------------------------------------------------------------------
-
-class HVReportingDriverPositionTest : public HVReportingDriverUtilityTest,
-                                      public testing::WithParamInterface<std::size_t> {
- protected:
-  HVReportingDriverPositionTest() {
-    for (const char* group : kGroups) {
-      platform_.ioReport.setGroup(group, {simpleChannel(group, 1)});
-    }
-  }
-  [[nodiscard]] static std::string failing() { return kGroups[GetParam()]; }
-  // The groups that do not fail, each behind these words.
-  static Texts othersAfter(std::string_view words) {
-    Texts texts;
-    for (const char* group : kGroups) {
-      if (group != failing()) texts.push_back(std::string(words) + group);
-    }
-    return texts;
-  }
-  // The simple values that were recorded, without their keys.
-  std::size_t recordedEntries() const {
-    const auto messages = recorded();
-    // The tag is the one entry that no channel gave.
-    return messages.empty() ? 0 : messages.front().size() - 1;
-  }
-};
-
-TEST_P(HVReportingDriverPositionTest, AFailingSubscriptionIsLeftOut) {
-  platform_.ioReport.failSubscription(failing(), {-5});
-
-  const HVReportingDriverUtility utility;
-
-  Texts subscribed;
-  for (const auto& one : utility.ioChannelSubscriptions()) {
-    subscribed.push_back(one.driver().description());
-  }
-  EXPECT_EQ(subscribed, othersAfter(""));
-  EXPECT_EQ(lines(LogLevel::kError), Texts{"error -5 creating subscription for " + failing()});
-}
-
-TEST_P(HVReportingDriverPositionTest, AFailingSnapshotIsLeftOutAndTheRestIsReported) {
-  const auto utility = makeUtility();
-  platform_.ioReport.failSamples(failing(), {-6});
-
-  const DriverSnapShot snapShot = utility.getSnapShot();
-
-  EXPECT_EQ(snapShot.size(), 7U);
-  EXPECT_FALSE(snapShot.contains(failing()));
-  EXPECT_EQ(lines(LogLevel::kError), Texts{"IOReportCreateSamples error -6"});
-}
-
-TEST_P(HVReportingDriverPositionTest, AFailingSampleAtTheStopIsLeftOutAndTheRestIsReported) {
-  const auto utility = makeUtility();
-  session_->setDriverSnapShot(utility.getSnapShot());
-  platform_.ioReport.failSamples(failing(), {-6});
-
-  utility.sendDriverLogsForSession(session_);
-
-  EXPECT_EQ(recordedEntries(), 7U);
-  EXPECT_EQ(lines(LogLevel::kError), Texts{"IOReportCreateSamples error -6"});
-}
-
-TEST_P(HVReportingDriverPositionTest, AFailingDeltaIsLoggedLikeASampleAndTheRestIsReported) {
-  const auto utility = makeUtility();
-  session_->setDriverSnapShot(utility.getSnapShot());
-  platform_.ioReport.failDelta(failing(), {-8});
-
-  utility.sendDriverLogsForSession(session_);
-
-  EXPECT_EQ(recordedEntries(), 7U);
-  EXPECT_EQ(lines(LogLevel::kError), Texts{"IOReportCreateSamples error -8"});
-}
-
-TEST_P(HVReportingDriverPositionTest, FailuresWithoutAnErrorSayNothing) {
-  platform_.ioReport.failDelta(failing(), {});
-  const auto utility = makeUtility();
-  session_->setDriverSnapShot(utility.getSnapShot());
-
-  utility.sendDriverLogsForSession(session_);
-  platform_.ioReport.failSamples(failing(), {});
-  utility.sendDriverLogsForSession(session_);
-
-  EXPECT_TRUE(lines(LogLevel::kError).empty());
-}
-
-INSTANTIATE_TEST_SUITE_P(EachGroup, HVReportingDriverPositionTest,
-                         testing::Range<std::size_t>(0, std::size(kGroups)));
-
 // --- Snapshot and report ------------------------------------------------------------------------
 
 TEST_F(HVReportingDriverUtilityTest, SnapshotSamplesEachSubscriptionUnderItsDescription) {
@@ -255,6 +105,45 @@ TEST_F(HVReportingDriverUtilityTest, WithoutASnapshotSamplesAreTakenButNothingIs
   EXPECT_EQ(platform_.journal.texts(), (Texts{"getting latest samples", "samples Speaker-(null)",
                                               "done getting latest samples"}));
   EXPECT_TRUE(recorded().empty());
+}
+
+TEST_F(HVReportingDriverUtilityTest, AFailingSampleIsToldAfterTheSamplingIsOver) {
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
+  const auto utility = makeUtility();
+  platform_.ioReport.failSamples("Speaker-(null)", {-6});
+
+  utility.sendDriverLogsForSession(session_);
+
+  EXPECT_EQ(platform_.journal.texts(),
+            (Texts{"getting latest samples", "samples Speaker-(null)",
+                   "done getting latest samples", "IOReportCreateSamples error -6"}));
+}
+
+TEST_F(HVReportingDriverUtilityTest, TheReportIsOfTheSamplesAtTheStop) {
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
+  const auto utility = makeUtility();
+  session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 5)});
+
+  utility.sendDriverLogsForSession(session_);
+
+  ASSERT_EQ(recorded().size(), 1U);
+  EXPECT_EQ(recorded()[0].find("Amp_Speaker_Simple_a")->toInt64(), 5);
+}
+
+TEST_F(HVReportingDriverUtilityTest, SessionsAtOnceEachHaveTheirOwnSnapshot) {
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
+  const auto utility = makeUtility();
+  const auto other = std::make_shared<HVReportingSession>(
+      ReporterID{8}, HVReportingSession::ProcessIdentifiers{12});
+  other->start();
+  session_->setDriverSnapShot(utility.getSnapShot());
+
+  utility.sendDriverLogsForSession(other);
+  EXPECT_TRUE((*other->nestedAggregatedPayloadData())->empty());
+  utility.sendDriverLogsForSession(session_);
+
+  EXPECT_EQ(recorded().size(), 1U);
 }
 
 TEST_F(HVReportingDriverUtilityTest, GroupThatIsNotInTheSnapshotIsLeftOutSilently) {

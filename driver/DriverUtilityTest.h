@@ -1,0 +1,82 @@
+#pragma once
+
+#include <memory>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include <gtest/gtest.h>
+
+#include "driver/HVReportingDriverUtility.h"
+#include "platform/fake/FakePlatform.h"
+#include "session/HVReportingSession.h"
+
+namespace halvox {
+// What tests of the sampler share.
+namespace driver_testing {
+
+using platform::Dictionary;
+using platform::LogLevel;
+using Channel = platform::FakeIOReportService::Channel;
+using Texts = std::vector<std::string>;
+
+// The groups that there may be, in their order.
+inline constexpr const char* kGroups[] = {"TarnoQ7AMP-(null)",
+                                          "Speaker-(null)",
+                                          "(null)-MCA",
+                                          "Haptics-Stats",
+                                          "StateTransitionTimes_ms-(null)",
+                                          "Rx-(null)",
+                                          "Tx-(null)",
+                                          "(null)-IOSndFam2"};
+
+inline Channel simpleChannel(std::string name, std::int64_t value) {
+  return {.driverName = "Amp<1>",
+          .group = "Speaker",
+          .channelName = std::move(name),
+          .integerValue = value};
+}
+
+// With a session that is started, and no channels yet.
+class DriverUtilityTest : public testing::Test {
+ protected:
+  DriverUtilityTest() {
+    session_->setServiceType(AudioServiceType::kHaptics);
+    session_->start();
+    forgetWhatHappened();
+  }
+
+  // A sampler of the groups that there are now, as the service makes it at its start.
+  HVReportingDriverUtility makeUtility() {
+    HVReportingDriverUtility utility;
+    forgetWhatHappened();
+    return utility;
+  }
+  void forgetWhatHappened() {
+    platform_.journal.clear();
+    platform_.log.clear();
+    platform_.analytics.clear();
+  }
+  // The lines of the driver statistics.
+  Texts lines(LogLevel level) const {
+    Texts texts;
+    for (const auto& line : platform_.log.lines(level)) {
+      if (line.category == "hvrd") texts.push_back(line.text);
+    }
+    return texts;
+  }
+  // The messages that the session recorded.
+  std::vector<Dictionary> recorded() const {
+    std::vector<Dictionary> messages;
+    const auto history = session_->nestedAggregatedPayloadData();
+    for (const auto& entry : **history) messages.push_back(entry.message());
+    return messages;
+  }
+
+  platform::FakePlatform platform_;
+  std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
+};
+
+}  // namespace driver_testing
+}  // namespace halvox
