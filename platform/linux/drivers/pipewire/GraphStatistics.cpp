@@ -28,6 +28,13 @@ std::string cleanName(std::string_view name) {
   return replaceInvalidUtf8(name.substr(0, length));
 }
 
+// What the key of a channel in a report has of its driver's name.
+std::string readName(std::string_view name) {
+  std::string read(name.substr(0, name.find('<')));
+  std::erase_if(read, [](char letter) { return letter == '_' || letter == ' '; });
+  return read;
+}
+
 }  // namespace
 
 GraphStatistics::GraphStatistics()
@@ -95,13 +102,18 @@ NodeStatistics* GraphStatistics::find(NodeID id) {
   return found == nodes_.end() ? nullptr : found->second.get();
 }
 
+// The number stands before any "<", so that it is in what is read of the name.
 std::string GraphStatistics::nameFor(NodeID id, std::string_view group,
                                      std::string_view name) const {
-  std::string clean = cleanName(name);
-  const bool isTaken = std::ranges::any_of(nodes_, [&](const auto& entry) {
-    return entry.second->group() == group && entry.second->driverName() == clean;
-  });
-  return isTaken ? clean + "<" + std::to_string(id) + ">" : clean;
+  std::string own = cleanName(name);
+  const auto isTaken = [&] {
+    return std::ranges::any_of(nodes_, [&](const auto& entry) {
+      return entry.second->group() == group &&
+             readName(entry.second->driverName()) == readName(own);
+    });
+  };
+  while (isTaken()) own.insert(std::min(own.find('<'), own.size()), "#" + std::to_string(id));
+  return own;
 }
 
 }  // namespace halvox::platform::linux_

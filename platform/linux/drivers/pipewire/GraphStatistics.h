@@ -36,7 +36,7 @@ class GraphStatistics {
   void profilingBegan();
 
   // False when the node is neither sink nor source, or one too many; nothing more need be told of
-  // it then. A second node of the same name is read as "name<id>".
+  // it then. A node whose name would be read like that of another is called "name#id".
   bool nodeAdded(NodeID id, std::string_view mediaClass, std::string_view name);
   void nodeRemoved(NodeID id);
   void nodeStateChanged(NodeID id, std::optional<NodeState> state, Time now);

@@ -154,8 +154,37 @@ TEST_F(GraphStatisticsTest, TheSecondNodeOfANameHasItsNumberBehindIt) {
   graph.nodeAdded(32, "Audio/Source", "twin");
 
   EXPECT_THAT(read("twin/Speaker"), Contains("twin/Speaker/PipeWire/cycles  = 0"));
-  EXPECT_THAT(read("twin<31>"), Contains("twin<31>/Speaker/PipeWire/cycles  = 0"));
+  EXPECT_THAT(read("twin#31"), Contains("twin#31/Speaker/PipeWire/cycles  = 0"));
   EXPECT_THAT(read("twin/Rx"), Contains("twin/Rx/PipeWire/cycles  = 0"));
+}
+
+// A report's keys have neither blanks nor underscores, and nothing of a driver's name from its
+// first "<" on.
+TEST_F(GraphStatisticsTest, NamesThatAReportCannotTellApartHaveTheirNumbersToo) {
+  graph.nodeAdded(30, "Audio/Sink", "usb_out");
+  graph.nodeAdded(31, "Audio/Sink", "usb out");
+  graph.nodeAdded(32, "Audio/Sink", "amp<1>");
+  graph.nodeAdded(33, "Audio/Sink", "amp<2>");
+
+  EXPECT_THAT(read("usb out#31/"), Contains(EndsWith("/cycles  = 0")));
+  EXPECT_THAT(read("amp#33<2>/"), Contains(EndsWith("/cycles  = 0")));
+}
+
+TEST_F(GraphStatisticsTest, ANumberBehindANameIsNoOtherNodesNameEither) {
+  graph.nodeAdded(30, "Audio/Sink", "twin#32");
+  graph.nodeAdded(31, "Audio/Sink", "twin");
+  graph.nodeAdded(32, "Audio/Sink", "twin");
+
+  EXPECT_THAT(read("twin#32#32/"), Contains(EndsWith("/cycles  = 0")));
+}
+
+TEST_F(GraphStatisticsTest, TwoNodesOfOneNameCountApart) {
+  graph.nodeAdded(30, "Audio/Sink", "twin");
+  graph.nodeAdded(40, "Audio/Sink", "twin");
+  graph.cycleEnded({.time = 1s, .length = 10ms, .driver = ProfiledNode{.id = 30}});
+
+  EXPECT_THAT(read("twin/"), Contains(EndsWith("/cycles  = 1")));
+  EXPECT_THAT(read("twin#40/"), Contains(EndsWith("/cycles  = 0")));
 }
 
 TEST_F(GraphStatisticsTest, ANodeThatGoesTakesItsChannelsAndItsSuccessorCountsFromZero) {
