@@ -65,13 +65,32 @@ std::shared_ptr<const Reading> AlsaSource::read() {
       const auto number = numberBehind(folder, "card");
       if (!number.has_value()) continue;
       const auto name = names.find(*number);
-      readCard(asound.get(), folder, {name == names.end() ? folder : name->second});
+      readCard(asound.get(), folder,
+               {nameFor(folder, name == names.end() ? folder : name->second, *number)});
     }
   }
   const auto isGone = [this](const auto& item) { return item.second.round != round_; };
   std::erase_if(substreams_, isGone);
   std::erase_if(powers_, isGone);
+  std::erase_if(cardNames_, isGone);
   return readings_.finish();
+}
+
+// Of several cards of one name those that came later are told apart by their number. A card keeps
+// what it was called when another goes: it is no other card by that.
+std::string AlsaSource::nameFor(const std::string& folder, const std::string& name,
+                                unsigned number) {
+  const auto known = cardNames_.find(folder);
+  if (known != cardNames_.end() && known->second.own == name) {
+    known->second.round = round_;
+    return known->second.shown;
+  }
+  const bool isTaken = std::ranges::any_of(cardNames_, [&](const auto& other) {
+    return other.first != folder && other.second.shown == name;
+  });
+  const std::string shown = isTaken ? name + " " + std::to_string(number) : name;
+  cardNames_.insert_or_assign(folder, CardName{name, shown, round_});
+  return shown;
 }
 
 void AlsaSource::readCard(int asound, const std::string& folder, Card card) {

@@ -20,8 +20,9 @@ namespace halvox::platform::linux_ {
 //   "Rx" capture
 //   "StateTransitionTimes_ms" "Runtime"     "power": active and suspended
 //
-// The driver is the card's name. Of a PCM with several substreams the others than the first have
-// their number in the channel's name. Whatever is not there, or goes while it is read, is left out.
+// The driver is the card's name; of several cards of one name the later ones have their number
+// behind it. Of a PCM with several substreams the others than the first have their number in the
+// channel's name. Whatever is not there, or goes while it is read, is left out.
 class AlsaSource final : public DriverSource {
  public:
   using Clock = PcmCounters::Clock;
@@ -40,6 +41,11 @@ class AlsaSource final : public DriverSource {
     std::string name;
     std::map<std::string, int> pcmNames{};  // how often each, with its direction
   };
+  struct CardName {
+    std::string own;    // as the kernel tells it
+    std::string shown;  // as no other card is called
+    std::uint64_t round = 0;
+  };
   struct Substream {
     PcmCounters counters;
     std::uint64_t round = 0;
@@ -51,6 +57,8 @@ class AlsaSource final : public DriverSource {
     std::uint64_t round = 0;
   };
 
+  [[nodiscard]] std::string nameFor(const std::string& folder, const std::string& name,
+                                    unsigned number);
   void readCard(int asound, const std::string& folder, Card card);
   void readPcm(int cardDirectory, const std::string& path, const std::string& folder, Card& card);
   void readSubstream(int pcmDirectory, const std::string& path, const std::string& folder,
@@ -61,6 +69,7 @@ class AlsaSource final : public DriverSource {
   const std::function<Clock::time_point()> now_;
   Clock::time_point time_{};
   std::uint64_t round_ = 0;
+  std::map<std::string, CardName> cardNames_;    // by the card's folder
   std::map<std::string, Substream> substreams_;  // by path
   std::map<std::string, Power> powers_;          // by the card's folder
   ReadingMaker readings_;

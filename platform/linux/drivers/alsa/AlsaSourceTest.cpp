@@ -33,6 +33,18 @@ class AlsaSourceTest : public ::testing::Test {
               "\ntrigger_time: 1.0\n-----\nhw_ptr      : " + std::to_string(hardware) +
               "\nappl_ptr    : " + std::to_string(application) + "\n");
   }
+  // The same card once more, in another socket.
+  void addTwinOfUsbCard() {
+    for (const char* folder : {"proc/asound/", "sys/class/sound/"}) {
+      std::filesystem::copy(root_.path() / folder / "card1", root_.path() / folder / "card2",
+                            std::filesystem::copy_options::recursive);
+    }
+    write("proc/asound/cards",
+          " 1 [Interface      ]: USB-Audio - Scarlet Two\n"
+          "                      Maker Scarlet Two at usb-0000:00:14.0-2, high speed\n"
+          " 2 [Interface_1    ]: USB-Audio - Scarlet Two\n"
+          "                      Maker Scarlet Two at usb-0000:00:14.0-3, high speed\n");
+  }
   std::vector<std::string> show() { return testing::describe(samplesOf(source_.read())); }
   std::vector<std::string> change(const std::function<void()>& act) {
     const auto before = source_.read();
@@ -177,6 +189,45 @@ TEST_F(AlsaSourceTest, ACardThatIsPluggedInAgainCountsFromZero) {
   });
 
   EXPECT_EQ(lines[3], "Scarlet Two/Tx/USB Audio/frames frames = 480");
+}
+
+// A link to nowhere stands in its directory, and cannot be opened any more.
+TEST_F(AlsaSourceTest, WhatIsGoneWhenItsDirectoryHasBeenListedIsLeftOut) {
+  use("analogue");
+  const auto asound = root_.path() / "proc/asound";
+  const auto before = show();
+
+  for (const char* gone : {"card1", "card0/pcm9p", "card0/pcm0p/sub7"}) {
+    std::filesystem::create_directory_symlink("nowhere", asound / gone);
+  }
+
+  EXPECT_EQ(show(), before);
+}
+
+TEST_F(AlsaSourceTest, TwoCardsOfOneNameAreToldApart) {
+  use("usb");
+  addTwinOfUsbCard();
+
+  const auto lines = show();
+
+  EXPECT_THAT(lines, SizeIs(20));
+  EXPECT_THAT(lines,
+              ::testing::IsSupersetOf({"Scarlet Two/Tx/USB Audio/frames frames = 96000",
+                                       "Scarlet Two 2/Tx/USB Audio/frames frames = 96000",
+                                       "Scarlet Two 2/StateTransitionTimes_ms/Runtime/power ms = "
+                                       "active:0:98000"}));
+}
+
+TEST_F(AlsaSourceTest, ACardGoesOnCountingUnderItsNameWhenItsTwinIsUnplugged) {
+  use("usb");
+  addTwinOfUsbCard();
+
+  const auto lines = change([this] {
+    std::filesystem::remove_all(root_.path() / "proc/asound/card1");
+    writeStatus("card2/pcm0p", "RUNNING", 96'480, 97'504, 2001);
+  });
+
+  EXPECT_THAT(lines, ::testing::Contains("Scarlet Two 2/Tx/USB Audio/frames frames = 480"));
 }
 
 TEST_F(AlsaSourceTest, WithoutCardsThereIsNothing) { EXPECT_THAT(show(), IsEmpty()); }
