@@ -94,7 +94,7 @@ using ValuesByChannel = std::unordered_map<const ChannelDescription*, Numbers>;
 
 ValuesByChannel index(const DriverSamples& samples) {
   ValuesByChannel values;
-  for (const auto& [reading, selection] : samples.parts()) {
+  for (const auto& [reading, selection, source] : samples.parts()) {
     for (const std::uint32_t position : *selection) {
       values.emplace((*reading->channels)[position].get(), valuesOf(*reading, position));
     }
@@ -117,8 +117,12 @@ void appendDifference(const ChannelDescription& channel, Numbers previous, Numbe
 
 }  // namespace
 
+bool DriverSamples::wasLate(std::size_t source) const {
+  return std::ranges::find(late_, source) != late_.end();
+}
+
 void DriverSamples::iterate(const IOReportService::Visitor& visitor) const {
-  for (const auto& [reading, selection] : parts_) {
+  for (const auto& [reading, selection, source] : parts_) {
     for (const std::uint32_t position : *selection) {
       if (show(*(*reading->channels)[position], valuesOf(*reading, position), visitor) != 0) return;
     }
@@ -130,7 +134,8 @@ std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
   const ValuesByChannel before = index(previous);
   std::vector<ChannelList::Channel> channels;
   auto reading = std::make_shared<Reading>();
-  for (const auto& [now, selection] : current.parts()) {
+  for (const auto& [now, selection, source] : current.parts()) {
+    if (previous.wasLate(source)) continue;
     for (const std::uint32_t position : *selection) {
       const ChannelList::Channel& channel = (*now->channels)[position];
       const auto found = before.find(channel.get());

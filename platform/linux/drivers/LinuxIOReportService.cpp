@@ -22,7 +22,7 @@ class GroupSelection {
     if (found.channels != reading->channels) {
       found = {reading->channels, find(*reading->channels)};
     }
-    return {std::move(reading), found.selection};
+    return {std::move(reading), found.selection, source};
   }
 
  private:
@@ -67,13 +67,17 @@ std::shared_ptr<const DriverSamples> sample(
   for (const auto& reader : readers) asked.push_back(reader->ask());
   const auto deadline = SourceReader::Clock::now() + SourceReader::kLongestWait;
   std::vector<DriverSamples::Part> parts;
+  DriverSamples::Sources late;
   for (std::size_t source = 0; source < readers.size(); ++source) {
     auto reading = readers[source]->take(std::move(asked[source]), deadline);
-    if (reading == nullptr) continue;
+    if (reading == nullptr) {
+      late.push_back(source);
+      continue;
+    }
     DriverSamples::Part part = group.select(source, std::move(reading));
     if (!part.selection->empty()) parts.push_back(std::move(part));
   }
-  return std::make_shared<DriverSamples>(std::move(parts));
+  return std::make_shared<DriverSamples>(std::move(parts), std::move(late));
 }
 
 const DriverSamples& samplesOf(const IOReportService::Samples& samples) {

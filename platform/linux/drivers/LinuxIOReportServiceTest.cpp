@@ -185,6 +185,28 @@ TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
   EXPECT_THAT(show(sample(found)), SizeIs(1));
 }
 
+// It counted since its driver was loaded, not since the session began.
+TEST_F(LinuxIOReportServiceTest, WhatASourceThatWasLateAtTheSnapshotCountedIsNotReported) {
+  const auto channel = simpleChannel("Tx", "a");
+  auto& service = serve([&] {
+    gate_.pass();
+    return makeReading({channel}, {1000});
+  });
+  const auto found = find("Tx", std::nullopt);
+  std::this_thread::sleep_for(2 * SourceReader::kMoment);
+  gate_.close();
+  const auto snapshot = sample(found);
+  gate_.open();
+
+  const auto deadline = Clock::now() + 10s;
+  auto now = sample(found);
+  while (show(now).empty() && Clock::now() < deadline) now = sample(found);
+
+  std::optional<IOReportError> error;
+  EXPECT_THAT(show(now), SizeIs(1));
+  EXPECT_THAT(show(service.IOReportCreateSamplesDelta(snapshot, now, error)), IsEmpty());
+}
+
 TEST_F(LinuxIOReportServiceTest, SourcesAreReadAtOnce) {
   std::atomic<bool> isOver{true};
   std::atomic<int> entered{0};
