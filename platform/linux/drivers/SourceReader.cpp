@@ -46,9 +46,7 @@ void SourceReader::waitUntilOpen() {
 SourceReader::Asked SourceReader::ask() {
   received_.add();
   const MutexLock lock(mutex_);
-  if (Clock::now() - newestTime_ < kMoment) {
-    if (ReadingPointer newest = newest_.lock()) return {.reading = std::move(newest)};
-  }
+  if (newest_ != nullptr && Clock::now() - newestTime_ < kMoment) return {.reading = newest_};
   // A source that is late is read all the same, to see whether it has come round.
   if (isLate_) {
     if (!std::exchange(isWanted_, true)) wanted_.notifyAll();
@@ -91,13 +89,30 @@ SourceReader::ReadingPointer SourceReader::waitFor(std::uint64_t number,
   return reading;
 }
 
+// Lets go of the newest reading when its moment is over.
+void SourceReader::waitUntilWanted() {
+  while (!isWanted_ && !isEnding_) {
+    if (newest_ == nullptr) {
+      wanted_.wait(mutex_);
+    } else if (!wanted_.waitUntil(mutex_, newestTime_ + kMoment)) {
+      ReadingPointer old = std::exchange(newest_, nullptr);
+      mutex_.unlock();
+      // What the source does when nobody holds its reading any more must hold up no asker.
+      old.reset();
+      mutex_.lock();
+    }
+  }
+}
+
 void SourceReader::run() {
   source_->open();
   mutex_.lock();
   while (true) {
-    while (!isWanted_ && !isEnding_) wanted_.wait(mutex_);
+    waitUntilWanted();
     if (isEnding_) break;
+    ReadingPointer old = std::exchange(newest_, nullptr);
     mutex_.unlock();
+    old.reset();
     const Clock::time_point start = Clock::now();
     ReadingPointer reading = source_->read();
     const Clock::time_point now = Clock::now();
@@ -105,9 +120,9 @@ void SourceReader::run() {
     if (now - start <= kLongestWait) isLate_ = false;
     isWanted_ = false;
     ++numberMade_;
-    newest_ = reading;
     newestTime_ = now;
-    if (waiting_ > 0) handedOver_ = std::move(reading);
+    if (waiting_ > 0) handedOver_ = reading;
+    newest_ = std::move(reading);
     made_.notifyAll();
   }
   mutex_.unlock();

@@ -12,8 +12,9 @@
 namespace halvox::platform::linux_ {
 
 // Reads one source on a thread of its own, so that whoever asks waits no longer than a bound.
-// Readings are shared: whoever asks within the same moment gets the same one. Any thread may ask.
-// Owns the source. Its end waits for a reading that is being made.
+// Readings are shared: whoever asks within the same moment gets the same one, so the groups of a
+// snapshot or report are of one moment. Any thread may ask. Owns the source. Its end waits for a
+// reading that is being made.
 class SourceReader {
  public:
   using Clock = std::chrono::steady_clock;
@@ -49,6 +50,7 @@ class SourceReader {
   using ReadingPointer = std::shared_ptr<const Reading>;
 
   void run();
+  void waitUntilWanted() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] std::uint64_t want() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] ReadingPointer waitFor(std::uint64_t number, Clock::time_point deadline)
       HALVOX_REQUIRES(mutex_);
@@ -66,9 +68,9 @@ class SourceReader {
   bool isLate_ HALVOX_GUARDED_BY(mutex_) = false;  // told, and not come round yet
   std::uint64_t numberMade_ HALVOX_GUARDED_BY(mutex_) = 0;
   int waiting_ HALVOX_GUARDED_BY(mutex_) = 0;
-  // Held only while somebody waits for it: a source looks at who holds its readings.
-  ReadingPointer handedOver_ HALVOX_GUARDED_BY(mutex_);
-  std::weak_ptr<const Reading> newest_ HALVOX_GUARDED_BY(mutex_);
+  // Each held only as long as it is of use: a source looks at who holds its readings.
+  ReadingPointer handedOver_ HALVOX_GUARDED_BY(mutex_);  // while somebody waits for it
+  ReadingPointer newest_ HALVOX_GUARDED_BY(mutex_);      // for its moment
   Clock::time_point newestTime_ HALVOX_GUARDED_BY(mutex_){};
   std::thread thread_;
 };
