@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <functional>
 #include <system_error>
 #include <unordered_set>
 #include <utility>
@@ -114,12 +115,17 @@ void TextfileSource::readEntry(int directory, const std::string& file, Entry& en
   if (!isSame) entry.complaint.clear();
   entry.state = state;
   entry.isSettled = state.error != 0 || now() - state.changedAt > kTimeStep;
-  entry.isGood = false;
-  isChanged_ = true;
 
   const SmallFile content = readSmallFile(directory, file.c_str(), OpenMetricsText::kLargestText);
+  const std::size_t hash = std::hash<std::string>()(content.text);
+  const bool isRead = content.outcome == SmallFile::Outcome::kRead;
+  // Few of the files that are looked at again did change again.
+  if (isSame && isRead && entry.hash == hash) return;
+  entry.hash = isRead ? std::optional(hash) : std::nullopt;
+  entry.isGood = false;
+  isChanged_ = true;
   if (content.outcome == SmallFile::Outcome::kMissing) return;  // gone since it was listed
-  if (content.outcome != SmallFile::Outcome::kRead) {
+  if (!isRead) {
     return complain(file, ": " + reasonOf(content) + kLeftOut, entry);
   }
   auto parsed = MetricChannels::from(content.text);

@@ -4,6 +4,7 @@
 #include <filesystem>
 #include <map>
 #include <memory>
+#include <optional>
 #include <string>
 #include <variant>
 #include <vector>
@@ -43,7 +44,8 @@ class TextfileSource final : public DriverSource {
   };
   struct Entry {
     State state{};
-    bool isSettled = false;  // the state tells every further change
+    bool isSettled = false;             // the state tells every further change
+    std::optional<std::size_t> hash{};  // of the content, if it could be read
     bool isGood = false;
     std::vector<Channel> channels{};  // kept while the file is wrong, for their identity
     std::vector<std::vector<std::uint64_t>> values{};
