@@ -57,6 +57,15 @@ class Startup(unittest.TestCase):
 
         self.assert_refused(result, EX_CONFIG, "halvox.toml:3:")
 
+    def test_key_of_100_000_words_is_refused_and_ends_nothing_else(self):
+        words = ".".join(["a"] * 100_000)
+        for text in (f"{words} = 1\n", f"[{words}]\n", f"a = {{{words} = 1}}\n"):
+            result = self.run_service("# one line\n" + text)
+
+            self.assert_refused(result, EX_CONFIG, "halvox.toml:2:", "levels of tables")
+            self.assertEqual(result.stderr.count("\n"), 1)
+            self.assertLess(len(result.stderr), 1000)
+
     def test_unreadable_configuration(self):
         (self.directory / "halvox.toml").mkdir()
         result = self.run_service(None)

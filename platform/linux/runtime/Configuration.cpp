@@ -15,6 +15,7 @@
 #include "platform/linux/UniqueHandle.h"
 #include "platform/linux/runtime/ConfigurationEnvironment.h"
 #include "platform/linux/runtime/ConfigurationReader.h"
+#include "platform/linux/runtime/TomlNesting.h"
 #include "platform/linux/runtime/Utf8.h"
 
 namespace halvox::platform::linux_ {
@@ -211,6 +212,13 @@ void readDrivers(TableReader table, Configuration::Drivers& drivers) {
 std::variant<Configuration, ConfigurationError> parse(const std::string& file,
                                                       std::string_view text) {
   ConfigurationMistakes mistakes(file);
+  if (const auto line = lineNestedTooDeep(text)) {
+    mistakes.add(
+        {static_cast<toml::source_index>(*line), 1},
+        fmt::format("the file: expected at most {} levels of tables and arrays, found more",
+                    kDeepestNesting));
+    return *mistakes.first();
+  }
   const toml::parse_result parsed = toml::parse(text);
   if (!parsed) {
     const toml::parse_error& error = parsed.error();

@@ -405,6 +405,17 @@ TEST_F(ConfigurationTest, SocketPathMustFitIntoAnAddress) {
               HasSubstr("listener.socket: expected an absolute path of at most 107 bytes, found"));
 }
 
+// Walking through as many tables as such a key makes would end the process.
+TEST_F(ConfigurationTest, KeyOfManyWordsIsToldWithItsLine) {
+  std::string key = "a";
+  for (int count = 1; count < 100'000; ++count) key += ".a";
+
+  for (const std::string& line : {key + " = 1\n", "[" + key + "]\n", "b = {" + key + " = 1}\n"}) {
+    EXPECT_EQ(mistake("[log]\n\n" + line),
+              "3:1: the file: expected at most 256 levels of tables and arrays, found more");
+  }
+}
+
 TEST_F(ConfigurationTest, SyntaxErrorIsToldWithItsPlace) {
   EXPECT_THAT(mistake("[listener]\nsocket = = 3\n"),
               StartsWith("2:10: the file: expected TOML, found a mistake: "));

@@ -6,9 +6,9 @@
 #include <optional>
 #include <utility>
 
+#include "platform/linux/runtime/TomlNesting.h"
 #include "platform/linux/runtime/Utf8.h"
 #include "platform/linux/settings/SettingNames.h"
-#include "platform/linux/settings/TomlNesting.h"
 #include "platform/linux/settings/TomlValues.h"
 
 namespace halvox::platform::linux_ {

@@ -10,9 +10,9 @@
 #include <unistd.h>
 
 #include "platform/linux/UniqueHandle.h"
+#include "platform/linux/runtime/TomlNesting.h"
 #include "platform/linux/runtime/Utf8.h"
 #include "platform/linux/settings/SettingNames.h"
-#include "platform/linux/settings/TomlNesting.h"
 #include "platform/linux/settings/TomlValues.h"
 
 namespace halvox::platform::linux_ {

@@ -1,4 +1,4 @@
-#include "platform/linux/settings/TomlNesting.h"
+#include "platform/linux/runtime/TomlNesting.h"
 
 #include <algorithm>
 #include <utility>
@@ -12,12 +12,14 @@ class NestingScan {
  public:
   explicit NestingScan(std::string_view text) : rest_(text) {}
 
-  bool isTooDeep() {
+  // How much of the text has been read when it is too deep; none when it never is.
+  std::optional<std::size_t> find() {
+    const std::size_t size = rest_.size();
     while (!rest_.empty()) {
       take(rest_.front());
-      if (depth_ > kDeepestNesting) return true;
+      if (depth_ > kDeepestNesting) return size - rest_.size();
     }
-    return false;
+    return std::nullopt;
   }
 
  private:
@@ -98,6 +100,10 @@ class NestingScan {
 
 }  // namespace
 
-bool isNestedTooDeep(std::string_view text) { return NestingScan(text).isTooDeep(); }
+std::optional<std::size_t> lineNestedTooDeep(std::string_view text) {
+  const auto read = NestingScan(text).find();
+  if (!read.has_value()) return std::nullopt;
+  return static_cast<std::size_t>(std::ranges::count(text.substr(0, *read), '\n')) + 1;
+}
 
 }  // namespace halvox::platform::linux_

@@ -1,4 +1,4 @@
-#include "platform/linux/settings/TomlNesting.h"
+#include "platform/linux/runtime/TomlNesting.h"
 
 #include <string>
 
@@ -55,6 +55,12 @@ TEST(TomlNestingTest, QuotesAtTheEndOfALongTextHideNothing) {
     const std::string line = "a = {b = " + std::string(text) + ", " + key(1000) + " = 1}";
     EXPECT_TRUE(isNestedTooDeep(line)) << text;
   }
+}
+
+TEST(TomlNestingTest, TellsTheFirstLineThatIsTooDeep) {
+  EXPECT_EQ(lineNestedTooDeep("a.b = 1\n"), std::nullopt);
+  EXPECT_EQ(lineNestedTooDeep(key(1000)), 1U);
+  EXPECT_EQ(lineNestedTooDeep("a = \"\"\"\n\n\"\"\"\n" + key(1000) + "\n" + key(1000)), 4U);
 }
 
 TEST(TomlNestingTest, TextsThatEndTooEarlyAreHarmless) {
