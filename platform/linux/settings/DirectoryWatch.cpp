@@ -33,10 +33,8 @@ std::vector<std::filesystem::path> normal(std::vector<std::filesystem::path> pat
 
 }  // namespace
 
-DirectoryWatch::DirectoryWatch(std::vector<std::filesystem::path> directories)
-    : directories_(normal(std::move(directories))), isThere_(directories_.size(), false) {}
-
-std::error_code DirectoryWatch::arm() {
+std::error_code DirectoryWatch::arm(std::vector<std::filesystem::path> directories) {
+  directories_ = normal(std::move(directories));
   watches_.clear();
   isThere_.assign(directories_.size(), false);
   inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));

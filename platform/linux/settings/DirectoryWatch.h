@@ -30,12 +30,10 @@ class DirectoryWatch {
   using OnChange = std::function<void(std::size_t directory, std::string_view file, Change change)>;
   enum class State : unsigned char { kArmed, kMustBeArmedAgain };
 
-  // Absolute paths.
-  explicit DirectoryWatch(std::vector<std::filesystem::path> directories);
-
-  // Begins anew. What happened before, also unnoticed, is for the caller to find out afterwards.
-  // Gives the reason when a directory cannot be watched though it is there.
-  [[nodiscard]] std::error_code arm();
+  // Begins anew, with these directories, which are absolute paths. What happened before, also
+  // unnoticed, is for the caller to find out afterwards. Gives the reason when a directory cannot
+  // be watched though it is there.
+  [[nodiscard]] std::error_code arm(std::vector<std::filesystem::path> directories);
   // Whether that directory was there at the last arm().
   [[nodiscard]] bool isThere(std::size_t directory) const { return isThere_[directory]; }
   [[nodiscard]] const std::filesystem::path& path(std::size_t directory) const {
@@ -56,7 +54,7 @@ class DirectoryWatch {
   [[nodiscard]] std::error_code add(const std::filesystem::path& path, std::uint32_t events,
                                     Watch*& watch);
 
-  const std::vector<std::filesystem::path> directories_;
+  std::vector<std::filesystem::path> directories_;
   UniqueFd inotify_;
   std::map<int, Watch> watches_;
   std::vector<bool> isThere_;  // by directory

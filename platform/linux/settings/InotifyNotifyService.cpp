@@ -28,8 +28,10 @@ constexpr auto kQuietTime = 50ms;
 constexpr auto kLongestDelay = 300ms;
 constexpr auto kRetryTime = 5s;
 
-// The directories that are watched, in order.
+// The directories that are always watched, in order.
 constexpr std::size_t kNotifyDirectory = 0;
+constexpr std::size_t kPreferenceDirectory = 1;
+constexpr std::size_t kFirstLinked = 2;
 
 int pollTimeout(std::optional<std::chrono::steady_clock::time_point> until) {
   if (!until.has_value()) return -1;
@@ -48,7 +50,7 @@ void drain(int descriptor) {
 InotifyNotifyService::InotifyNotifyService(const std::filesystem::path& directory,
                                            const PreferenceReader& preferences,
                                            StatisticsService& statistics)
-    : watch_({directory, preferences.directory() / kPreferenceUser}),
+    : directories_{directory, preferences.directory() / kPreferenceUser},
       settings_(directory, preferences, statistics),
       delivered_(statistics.counter("notifications", "handlers called")) {}
 
@@ -108,6 +110,7 @@ void InotifyNotifyService::run() {
     if (polled[0].revents != 0) drain(wake);
     if (polled[1].revents != 0) readChanges();
     if (retryAt_.has_value() && Clock::now() >= *retryAt_) arm();
+    followLinks();
     deliver();
   }
 }
@@ -130,7 +133,10 @@ bool InotifyNotifyService::adoptRegistrations() {
 
 void InotifyNotifyService::arm() {
   const bool wasFailing = retryAt_.has_value();
-  const std::error_code error = watch_.arm();
+  linked_ = settings_.linkedSettings();
+  std::vector<std::filesystem::path> directories = directories_;
+  for (const LinkedSetting& one : linked_) directories.push_back(one.file.parent_path());
+  const std::error_code error = watch_.arm(std::move(directories));
   retryAt_.reset();
   if (error) {
     retryAt_ = Clock::now() + kRetryTime;
@@ -144,6 +150,11 @@ void InotifyNotifyService::arm() {
   tellOfNotifyDirectory();
   settings_.noteEverything();
   noteNews();
+}
+
+// Whatever has changed, the links may have, and lead elsewhere now.
+void InotifyNotifyService::followLinks() {
+  if (settings_.hasNews() && settings_.linkedSettings() != linked_) arm();
 }
 
 // Whoever deletes the directory should read in the log why nothing is heard any more, and of its
@@ -163,7 +174,10 @@ void InotifyNotifyService::tellOfNotifyDirectory() {
 void InotifyNotifyService::readChanges() {
   const auto state = watch_.read(
       [this](std::size_t directory, std::string_view file, DirectoryWatch::Change change) {
-        if (directory != kNotifyDirectory) {
+        if (directory >= kFirstLinked) {
+          const LinkedSetting& linked = linked_[directory - kFirstLinked];
+          if (linked.file.filename() == file) settings_.noteDomain(linked.domain);
+        } else if (directory == kPreferenceDirectory) {
           settings_.notePreferenceFile(file);
         } else if (change == DirectoryWatch::Change::kFileChanged) {
           settings_.noteNotifyFile(file);

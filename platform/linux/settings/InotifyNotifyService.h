@@ -27,8 +27,9 @@ inline constexpr NotifyStatus kNotifyFailed = 1'000'000;
 // lost.
 //
 // A thread of its own waits for the files, from the first registration on; it sleeps while nothing
-// happens. Directories may be missing, and may be deleted and made again. When watching fails (the
-// kernel's limits) it says so once and tries again.
+// happens. Directories may be missing, and may be deleted and made again. Symbolic links on the way
+// to a preference file are followed: a change behind them, or of one of them, counts. When watching
+// fails (the kernel's limits) it says so once and tries again.
 class InotifyNotifyService final : public NotifyService {
  public:
   // Does not own the reader and the statistics, which must outlive it.
@@ -60,13 +61,17 @@ class InotifyNotifyService final : public NotifyService {
   void run();
   [[nodiscard]] bool adoptRegistrations() HALVOX_EXCLUDES(mutex_);
   void arm();
+  void followLinks();
   void tellOfNotifyDirectory();
   void readChanges();
   void noteNews();
   void deliver();
   [[nodiscard]] std::optional<Clock::time_point> nextWork() const;
 
+  // The directories that are always watched, in order; those of `linked_` come behind them.
+  const std::vector<std::filesystem::path> directories_;
   DirectoryWatch watch_;
+  std::vector<LinkedSetting> linked_;  // as watched
   bool hasNotifyDirectory_ = false;
   bool notifyDirectoryWasGone_ = false;
   WatchedSettings settings_;

@@ -36,11 +36,12 @@ class InotifyNotifyServiceTest : public SettingsTest {
     write(notify() / kSentinel, "");
     ASSERT_TRUE(waitForPosts(sentinel_, before + 1));
   }
+  // The sentinel comes last, so that what is posted with it is posted before it.
   void begin() {
-    ASSERT_EQ(service_.notify_register_dispatch(kSentinel, sentinel_, queue_,
+    ASSERT_EQ(service_.notify_register_dispatch(kName, name_, queue_,
                                                 [this](NotifyToken fired) { ++posts_[fired]; }),
               0U);
-    ASSERT_EQ(service_.notify_register_dispatch(kName, name_, queue_,
+    ASSERT_EQ(service_.notify_register_dispatch(kSentinel, sentinel_, queue_,
                                                 [this](NotifyToken fired) { ++posts_[fired]; }),
               0U);
     waitUntilSettled();
@@ -130,6 +131,7 @@ TEST_F(InotifyNotifyServiceTest, APostCallsEveryHandlerOfThatNameWithItsToken) {
             0U);
 
   EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);
+  EXPECT_TRUE(waitForPosts(second, 1));
   EXPECT_EQ(posts(second), 1);
   EXPECT_NE(second, name_);
 }
@@ -254,6 +256,77 @@ TEST_F(InotifyNotifyServiceTest, AllDirectoriesOnTheWayMayGoAndComeBack) {
   ASSERT_TRUE(waitForPosts(name_, 2));
 
   EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);
+}
+
+TEST_F(InotifyNotifyServiceTest, AFileBehindALinkIsFollowed) {
+  const auto file = domainFile(kDomain);
+  const auto real = scratch_ / "elsewhere" / "settings";
+  write(real, "a = 1");
+  std::filesystem::create_directories(file.parent_path());
+  std::filesystem::create_symlink(real, file);
+  begin();
+
+  EXPECT_EQ(postsOf([&] { write(real, "a = 2"); }), 1) << "written";
+  EXPECT_EQ(postsOf([&] {
+              write(scratch_ / "elsewhere" / "new", "a = 3");
+              std::filesystem::rename(scratch_ / "elsewhere" / "new", real);
+            }),
+            1)
+      << "renamed over";
+  EXPECT_EQ(postsOf([&] { write(scratch_ / "elsewhere" / "other", "a = 4"); }), 0);
+  EXPECT_EQ(postsOf([&] { std::filesystem::remove_all(scratch_ / "elsewhere"); }), 1) << "removed";
+  EXPECT_EQ(postsOf([&] { write(real, "a = 5"); }), 1) << "made again";
+}
+
+TEST_F(InotifyNotifyServiceTest, AFileThatBecomesALinkIsFollowed) {
+  const auto file = domainFile(kDomain);
+  write(file, "a = 1");
+  begin();
+  write(scratch_ / "one", "a = 1");
+  write(scratch_ / "two", "a = 2");
+  const auto pointTo = [&](const char* name) {
+    std::filesystem::create_symlink(scratch_ / name, scratch_ / "link");
+    std::filesystem::rename(scratch_ / "link", file);
+  };
+
+  EXPECT_EQ(postsOf([&] { pointTo("one"); }), 0) << "of the same values";
+  EXPECT_EQ(postsOf([&] { write(scratch_ / "one", "a = 11"); }), 1);
+  EXPECT_EQ(postsOf([&] { pointTo("two"); }), 1);
+  EXPECT_EQ(postsOf([&] { write(scratch_ / "one", "a = 12"); }), 0);
+  EXPECT_EQ(postsOf([&] { write(scratch_ / "two", "a = 22"); }), 1);
+}
+
+// As settings are kept that are replaced all at once.
+TEST_F(InotifyNotifyServiceTest, ALinkedDirectoryOnTheWayIsFollowed) {
+  const auto directory = preferences() / "mobile";
+  write(directory / "..1" / "org.example.toml", "a = 1");
+  write(directory / "..2" / "org.example.toml", "a = 2");
+  std::filesystem::create_directory_symlink("..1", directory / "..data");
+  std::filesystem::create_symlink("..data/org.example.toml", domainFile(kDomain));
+  begin();
+
+  EXPECT_EQ(postsOf([&] {
+              std::filesystem::create_directory_symlink("..2", directory / "..new");
+              std::filesystem::rename(directory / "..new", directory / "..data");
+            }),
+            1);
+  EXPECT_EQ(postsOf([&] { write(directory / "..2" / "org.example.toml", "a = 3"); }), 1);
+}
+
+TEST_F(InotifyNotifyServiceTest, ADirectoryOfPreferencesThatIsALinkIsFollowed) {
+  write(scratch_ / "one" / "org.example.toml", "a = 1");
+  write(scratch_ / "two" / "org.example.toml", "a = 2");
+  std::filesystem::create_directories(preferences());
+  std::filesystem::create_directory_symlink(scratch_ / "one", preferences() / "mobile");
+  begin();
+
+  EXPECT_EQ(postsOf([&] { write(scratch_ / "one" / "org.example.toml", "a = 3"); }), 1);
+  EXPECT_EQ(postsOf([&] {
+              std::filesystem::create_directory_symlink(scratch_ / "two", preferences() / "new");
+              std::filesystem::rename(preferences() / "new", preferences() / "mobile");
+            }),
+            1);
+  EXPECT_EQ(postsOf([&] { write(scratch_ / "two" / "org.example.toml", "a = 4"); }), 1);
 }
 
 TEST_F(InotifyNotifyServiceTest, NoPreferenceIsMissedInAFloodOfEvents) {

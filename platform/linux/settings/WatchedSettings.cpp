@@ -4,6 +4,7 @@
 
 #include <sys/stat.h>
 
+#include "platform/linux/settings/LinkedFiles.h"
 #include "platform/linux/settings/PreferenceFile.h"
 
 namespace halvox::platform::linux_ {
@@ -69,9 +70,22 @@ void WatchedSettings::noteNotifyFile(std::string_view file) {
 
 void WatchedSettings::notePreferenceFile(std::string_view file) {
   if (!file.ends_with(kPreferenceEnding)) return;
-  file.remove_suffix(kPreferenceEnding.size());
-  const auto known = domains_.known.find(file);
+  noteDomain(file.substr(0, file.size() - kPreferenceEnding.size()));
+}
+
+void WatchedSettings::noteDomain(std::string_view domain) {
+  const auto known = domains_.known.find(domain);
   if (known != domains_.known.end()) domains_.news.insert(known->first);
+}
+
+std::vector<LinkedSetting> WatchedSettings::linkedSettings() const {
+  std::vector<LinkedSetting> linked;
+  for (const auto& [domain, known] : domains_.known) {
+    const auto path = preferencePath(reader_.directory(), kPreferenceUser, domain);
+    if (!path.has_value()) continue;
+    for (auto& file : linkedFiles(*path)) linked.push_back({std::move(file), domain});
+  }
+  return linked;
 }
 
 void WatchedSettings::noteEverything() {

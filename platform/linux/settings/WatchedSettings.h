@@ -21,6 +21,13 @@ struct FileMark {
   friend bool operator==(const FileMark&, const FileMark&) = default;
 };
 
+// A file, beside those in the directory of preferences, on which the values of a domain depend.
+struct LinkedSetting {
+  std::filesystem::path file;
+  std::string domain;
+  friend bool operator==(const LinkedSetting&, const LinkedSetting&) = default;
+};
+
 // How everything that posts one name looked at some moment.
 struct SettingBaseline {
   std::optional<FileMark> file;                 // of that name in the notify directory
@@ -52,8 +59,13 @@ class WatchedSettings {
   void noteNotifyFile(std::string_view file);
   // A file in the directory of preferences has changed.
   void notePreferenceFile(std::string_view file);
+  // What the file of that domain leads to has changed.
+  void noteDomain(std::string_view domain);
   // Anything may have changed.
   void noteEverything();
+
+  // The symbolic links on the way to the files of all domains, and what they lead to now.
+  [[nodiscard]] std::vector<LinkedSetting> linkedSettings() const;
 
   [[nodiscard]] bool hasNews() const { return !names_.news.empty() || !domains_.news.empty(); }
   // Looks at all that was noted, and gives the names to post, each once.

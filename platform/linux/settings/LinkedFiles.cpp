@@ -1,0 +1,43 @@
+#include "platform/linux/settings/LinkedFiles.h"
+
+#include <cstddef>
+#include <deque>
+#include <system_error>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+namespace fs = std::filesystem;
+
+// As many as the kernel follows.
+constexpr std::size_t kMostLinks = 40;
+
+}  // namespace
+
+std::vector<fs::path> linkedFiles(const fs::path& path) {
+  std::vector<fs::path> found;
+  std::deque<fs::path> rest(path.begin(), path.end());
+  fs::path way;
+  while (!rest.empty() && found.size() < kMostLinks) {
+    const fs::path part = rest.front();
+    rest.pop_front();
+    if (part.empty() || part == ".") continue;
+    if (part == "..") {
+      way = way.parent_path();
+      continue;
+    }
+    const fs::path next = way / part;  // an absolute part begins anew
+    std::error_code isNoLink;
+    const fs::path target = fs::read_symlink(next, isNoLink);
+    if (isNoLink) {
+      way = next;
+    } else {
+      found.push_back(next);
+      rest.insert(rest.begin(), target.begin(), target.end());
+    }
+  }
+  if (!found.empty()) found.push_back(way);
+  return found;
+}
+
+}  // namespace halvox::platform::linux_
