@@ -129,8 +129,13 @@ LinuxPlatform::LinuxPlatform(const Configuration& configuration)
       connections_(
           [this] {
             ConnectionOptions options = connectionOptions(configuration_);
-            options.beginBatch = [this] { dispatch_.beginHelping(); };
+            options.beginBatch = [this] {
+              dispatch_.holdPool();
+              dispatch_.beginHelping();
+            };
             options.endBatch = [this] { dispatch_.endHelping(); };
+            // A client's answer should not wait until other threads are woken.
+            options.afterReplies = [this] { dispatch_.wakePool(); };
             options.onReportSignal = [this] { logStatistics(LogLevel::kDefault, Counters::kAll); };
             return options;
           }(),

@@ -60,7 +60,7 @@ ConnectionHost::ConnectionHost(ConnectionOptions options, Backpressure& backpres
       handshakes_(options_.handshakeTimeout),
       messages_(options_.messageTimeout),
       acceptRetries_(kAcceptRetryDelay),
-      turn_(options_.beginBatch, options_.endBatch) {
+      turn_(options_.beginBatch, options_.endBatch, options_.afterReplies) {
   if (options_.signals == EndSignals::kHandle) SignalWatch::block();
   backpressure_.setReliefHandler([inbox = inbox_] { inbox->postRelief(); });
 }

@@ -162,6 +162,7 @@ TEST(LifecycleTest, BatchHooksSurroundDeliveriesAndRepliesOfTheEndAreWritten) {
       calls.emplace_back("end");
       if (object) object->answerHeld();
     };
+    options.afterReplies = [&] { calls.emplace_back("replies written"); };
   });
   object = service.delegate.object;
   const std::array argument = {Value(std::int64_t{1})};
@@ -172,9 +173,10 @@ TEST(LifecycleTest, BatchHooksSurroundDeliveriesAndRepliesOfTheEndAreWritten) {
   service.stop();
 
   ASSERT_TRUE(answer.has_value());
-  ASSERT_GE(calls.size(), 2U);
+  ASSERT_GE(calls.size(), 3U);
   for (std::size_t call = 0; call < calls.size(); ++call) {
-    EXPECT_EQ(calls[call], call % 2 == 0 ? "begin" : "end");
+    const std::array expected = {"begin", "end", "replies written"};
+    EXPECT_EQ(calls[call], expected.at(call % expected.size()));
   }
 }
 

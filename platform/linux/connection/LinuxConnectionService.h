@@ -33,10 +33,12 @@ struct ConnectionOptions {
   std::uint64_t clientSessions = 100'000;
   std::size_t maxFrameBytes = 32 * kMiB;
   EndSignals signals = EndSignals::kHandle;
-  // Called on the I/O thread before the first delivery of a turn and after the last one. A reply
-  // that is given on this thread during `endBatch` is written in the same turn.
+  // Called on the I/O thread before the first delivery of a turn, after the last one, and once the
+  // replies of the turn are written. A reply that is given on this thread during `endBatch` is
+  // among them.
   std::function<void()> beginBatch;
   std::function<void()> endBatch;
+  std::function<void()> afterReplies;
   // Called on the I/O thread at SIGUSR1, when the signals are handled.
   std::function<void()> onReportSignal;
 };

@@ -8,9 +8,11 @@
 
 namespace halvox::platform::linux_ {
 
-TurnSchedule::TurnSchedule(std::function<void()> beginBatch, std::function<void()> endBatch)
+TurnSchedule::TurnSchedule(std::function<void()> beginBatch, std::function<void()> endBatch,
+                           std::function<void()> afterReplies)
     : beginBatch_(std::move(beginBatch)),
       endBatch_(std::move(endBatch)),
+      afterReplies_(std::move(afterReplies)),
       requestsPerClient_(kTurnRequests) {}
 
 void TurnSchedule::deliverNext(std::shared_ptr<ClientConnection> client) {
@@ -59,6 +61,7 @@ void TurnSchedule::finishEnded() {
 
 void TurnSchedule::endDeliveries() {
   if (!std::exchange(inBatch_, false)) return;
+  hasReplies_ = true;
   if (endBatch_) endBatch_();
 }
 
@@ -72,6 +75,7 @@ void TurnSchedule::flush() {
   // A flush can make its owner deliver or end in the next turn, but adds no other flush.
   for (SocketStream* stream : flushing_) stream->flush();
   flushing_.clear();
+  if (std::exchange(hasReplies_, false) && afterReplies_) afterReplies_();
 }
 
 void TurnSchedule::clear() {

@@ -17,7 +17,9 @@ class SocketStream;
 // have just become readable. Belongs to the I/O thread.
 class TurnSchedule {
  public:
-  TurnSchedule(std::function<void()> beginBatch, std::function<void()> endBatch);
+  // The hooks of ConnectionOptions.
+  TurnSchedule(std::function<void()> beginBatch, std::function<void()> endBatch,
+               std::function<void()> afterReplies);
 
   // Lets a client deliver in the next turn. Once for each time it says so.
   void deliverNext(std::shared_ptr<ClientConnection> client);
@@ -51,7 +53,9 @@ class TurnSchedule {
 
   std::function<void()> beginBatch_;
   std::function<void()> endBatch_;
+  std::function<void()> afterReplies_;
   bool inBatch_ = false;
+  bool hasReplies_ = false;  // of a batch, not written yet
   std::size_t requestsPerClient_;
   Clients due_;   // this turn
   Clients next_;  // the next one

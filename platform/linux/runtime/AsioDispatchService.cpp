@@ -4,6 +4,7 @@
 #include <system_error>
 #include <utility>
 
+#include "platform/linux/runtime/BatchedTurns.h"
 #include "platform/linux/runtime/DispatchPool.h"
 #include "platform/linux/runtime/JobRunner.h"
 #include "platform/linux/runtime/OwnThreadQueue.h"
@@ -38,6 +39,10 @@ void AsioDispatchService::asyncAfterOnBackgroundQueue(std::chrono::nanoseconds d
 void AsioDispatchService::beginHelping() { HelpingThread::current().begin(); }
 
 void AsioDispatchService::endHelping() { HelpingThread::current().end(); }
+
+void AsioDispatchService::holdPool() { BatchedTurns::current().begin(); }
+
+void AsioDispatchService::wakePool() { BatchedTurns::current().end(); }
 
 bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
   const auto deadline = std::chrono::steady_clock::now() + limit;

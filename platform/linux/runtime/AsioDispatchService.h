@@ -25,8 +25,11 @@ class OwnThreadQueue;
 // endHelping(). Brief jobs that it adds to a queue with an own thread then wake nobody; at the end
 // it carries them out itself, as long as no job that may block is in front of them and the queue's
 // own thread is not at work. A small batch so costs no change of threads. The order of jobs is kept
-// and never two of a queue run at once, whoever runs them. Shared queues get the jobs of the
-// batch, and those that brief jobs add, at the end of it, so that the pool is woken once.
+// and never two of a queue run at once, whoever runs them.
+//
+// Holding the pool: what a thread adds to shared queues between holdPool() and wakePool() runs from
+// the latter on, so that many jobs wake the pool once, when the thread has time for it. A thread of
+// an own queue holds it by itself while it runs brief jobs.
 class AsioDispatchService final : public DispatchService {
  public:
   // Both services must outlive this one and its queues. Throws std::system_error when the system
@@ -40,9 +43,12 @@ class AsioDispatchService final : public DispatchService {
   std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals) override;
   void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) override;
 
-  // From the same thread, in turns. Whoever begins must reach the end soon: the jobs wait for it.
+  // From the same thread, in turns. Whoever begins or holds must reach the end soon: the jobs wait
+  // for it.
   void beginHelping();
   void endHelping();
+  void holdPool();
+  void wakePool();
 
   // Ends all threads: the jobs that run end, those that wait, those of waiting queues and those to
   // come are discarded and counted. Waits for `limit` at most; false when a job still runs then,

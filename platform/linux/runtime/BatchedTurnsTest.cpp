@@ -44,16 +44,16 @@ class BatchedTurnsTest : public ::testing::Test {
   AsioDispatchService service_{log_, statistics_};
 };
 
-TEST_F(BatchedTurnsTest, JobsOfABatchWakeThePoolAtItsEnd) {
+TEST_F(BatchedTurnsTest, JobsRunWhenThePoolIsNotHeldAnyMore) {
   const auto queue = createQueue(QueueThreading::kShared);
   std::atomic<int> ran = 0;
 
-  service_.beginHelping();
+  service_.holdPool();
   queue->async(JobWeight::kMayBlock, [&ran] { ++ran; });
   queue->async(JobWeight::kMayBlock, [&ran] { ++ran; });
   ASSERT_TRUE(passJobs());
   EXPECT_EQ(ran, 0);
-  service_.endHelping();
+  service_.wakePool();
 
   EXPECT_TRUE(waitFor([&ran] { return ran == 2; }));
 }
@@ -64,21 +64,23 @@ TEST_F(BatchedTurnsTest, JobsThatHelpedJobsHandOnWakeThePoolToo) {
   std::promise<void> done;
   auto ran = done.get_future();
 
+  service_.holdPool();
   service_.beginHelping();
   own->async(JobWeight::kBrief, [&shared, &done] {
     shared->async(JobWeight::kMayBlock, [&done] { done.set_value(); });
   });
   service_.endHelping();
+  service_.wakePool();
 
   EXPECT_TRUE(isSet(ran));
 }
 
-TEST_F(BatchedTurnsTest, OutsideABatchAJobRunsAtOnce) {
+TEST_F(BatchedTurnsTest, AJobRunsAtOnceWhenThePoolIsNotHeld) {
   const auto queue = createQueue(QueueThreading::kShared);
   std::promise<void> done;
   auto ran = done.get_future();
-  service_.beginHelping();
-  service_.endHelping();
+  service_.holdPool();
+  service_.wakePool();
 
   queue->async(JobWeight::kMayBlock, [&done] { done.set_value(); });
 
@@ -122,10 +124,10 @@ TEST_F(BatchedTurnsTest, ABatchThatEndsAfterTheStopDiscardsItsJobs) {
   const auto queue = createQueue(QueueThreading::kShared);
   std::atomic<bool> ran = false;
 
-  service_.beginHelping();
+  service_.holdPool();
   queue->async(JobWeight::kMayBlock, [&ran] { ran = true; });
   EXPECT_TRUE(service_.stop(kTestDeadline));
-  service_.endHelping();
+  service_.wakePool();
 
   EXPECT_FALSE(ran);
   EXPECT_EQ(statistics_.counter("dispatch", "jobs discarded at the stop").value(), 1U);

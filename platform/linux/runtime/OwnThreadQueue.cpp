@@ -206,11 +206,6 @@ void OwnThreadQueue::runNext() {
   runner_->run(job);
 }
 
-void HelpingThread::begin() {
-  isActive_ = true;
-  turns_.begin();
-}
-
 HelpingThread& HelpingThread::current() {
   static thread_local HelpingThread thread;
   return thread;
@@ -224,7 +219,6 @@ void HelpingThread::end() {
   }
   queues_.clear();
   isActive_ = false;
-  turns_.end();
 }
 
 }  // namespace halvox::platform::linux_

@@ -14,7 +14,6 @@
 
 #include "platform/dispatch.h"
 #include "platform/linux/Mutex.h"
-#include "platform/linux/runtime/BatchedTurns.h"
 #include "platform/linux/runtime/JobRunner.h"
 
 namespace halvox::platform::linux_ {
@@ -118,14 +117,13 @@ class HelpingThread {
   static HelpingThread& current();
 
   [[nodiscard]] bool isActive() const { return isActive_; }
-  void begin();
+  void begin() { isActive_ = true; }
   // Helps each queue that was noted, in the order in which they were, those included that helped
   // jobs add to.
   void end();
   void note(std::shared_ptr<OwnThreadQueue> queue) { queues_.push_back(std::move(queue)); }
 
  private:
-  BatchedTurns& turns_ = BatchedTurns::current();  // made first, so that it goes last
   bool isActive_ = false;
   std::vector<std::shared_ptr<OwnThreadQueue>> queues_;
 };
