@@ -1,31 +1,32 @@
 #include "platform/linux/runtime/LogMemory.h"
 
 #include <algorithm>
-#include <memory>
 
 #include "platform/linux/runtime/LogSink.h"
 
 namespace halvox::platform::linux_ {
 
-LogMemory::LogMemory(LogLevel level, Bounds bounds) : level_(level), bounds_(bounds) {
-  lines_.resize(bounds_.lines);
-  ring_.resize(bounds_.bytes);
+LogMemory::LogMemory(LogLevel level, Bounds bounds)
+    : level_(level), bounds_(bounds), ring_(std::make_unique_for_overwrite<char[]>(bounds.bytes)) {
+  lines_.reserve(bounds_.lines);
 }
 
 void LogMemory::add(const LogEntry& entry, std::string_view line) {
   const MutexLock lock(mutex_);
-  line = line.substr(0, ring_.size());
+  line = line.substr(0, bounds_.bytes);
   // A text lies in one piece: the rest of the ring stays empty when it is too short.
-  const std::uint64_t room = ring_.size() - end_ % ring_.size();
+  const std::uint64_t room = bounds_.bytes - end_ % bounds_.bytes;
   if (room < line.size()) end_ += room;
   // What this text will lie over, and what lay in the part left empty, goes.
   const std::uint64_t end = end_ + line.size();
-  while (firstLine_ != endLine_ && (lines_[firstLine_ % lines_.size()].begin + ring_.size() < end ||
-                                    endLine_ - firstLine_ == lines_.size())) {
+  while (firstLine_ != endLine_ &&
+         (lines_[firstLine_ % bounds_.lines].begin + bounds_.bytes < end ||
+          endLine_ - firstLine_ == bounds_.lines)) {
     ++firstLine_;
   }
-  line.copy(&ring_[end_ % ring_.size()], line.size());
-  lines_[endLine_ % lines_.size()] = {.time = entry.time,
+  line.copy(&ring_[end_ % bounds_.bytes], line.size());
+  if (lines_.size() < bounds_.lines) lines_.emplace_back();
+  lines_[endLine_ % bounds_.lines] = {.time = entry.time,
                                       .subsystem = entry.subsystem,
                                       .category = entry.category,
                                       .begin = end_,
@@ -45,9 +46,9 @@ LogMemory::Contents LogMemory::contents() const {
   {
     const MutexLock lock(mutex_);
     for (std::uint64_t at = firstLine_; at != endLine_; ++at) {
-      lines.push_back(lines_[at % lines_.size()]);
+      lines.push_back(lines_[at % bounds_.lines]);
     }
-    ring.assign(ring_, 0, std::min<std::uint64_t>(end_, ring_.size()));
+    ring.assign(ring_.get(), std::min<std::uint64_t>(end_, bounds_.bytes));
     contents.added = endLine_;
   }
   contents.lines = lines.size();

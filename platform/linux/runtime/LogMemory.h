@@ -3,6 +3,7 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -56,10 +57,11 @@ class LogMemory {
   const LogLevel level_;
   const Bounds bounds_;
   mutable Mutex mutex_;
+  // Both have their addresses from the beginning, and memory as far as lines have come.
   std::vector<Line> lines_ HALVOX_GUARDED_BY(mutex_);  // a ring once it is full
+  std::unique_ptr<char[]> ring_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t firstLine_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t endLine_ HALVOX_GUARDED_BY(mutex_) = 0;
-  std::string ring_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t end_ HALVOX_GUARDED_BY(mutex_) = 0;  // where the next text begins
 };
 
