@@ -204,7 +204,7 @@ struct Run {
 };
 
 Result toLocal(const Run& run, ServerKind kind) {
-  const Server server(run.programs, kind);
+  const Server server(run.programs, kind, kLocalLink);
   return through(server, run.messages, [&] { return storedMessages(server.database()); });
 }
 

@@ -44,8 +44,8 @@ Cost pipelineCost(const Server& server, LoadClient& client, const LoadOptions& o
   return {messages / seconds, micros(serverCpu) / messages, micros(clientCpu) / messages};
 }
 
-Cost oneRun(const LoadOptions& options, ServerKind kind) {
-  const Server server(options.programs, kind);
+Cost oneRun(const LoadOptions& options, ServerKind kind, const char* link = kNoLink) {
+  const Server server(options.programs, kind, link);
   const auto client = server.client(1);
   client->pipeline(5000, options.window, options.shape);  // warm caches and pools
   return pipelineCost(server, *client, options, options.messages);
@@ -94,7 +94,7 @@ void measureThroughput(const LoadOptions& options, std::vector<Measurement>& res
   std::vector<Cost> unwanted;
   for (int round = 0; round < options.rounds; ++round) {
     echo.push_back(oneRun(options, ServerKind::kEcho));
-    linked.push_back(oneRun(options, ServerKind::kLinked));
+    linked.push_back(oneRun(options, ServerKind::kStored, kLocalLink));
     stored.push_back(oneRun(options, ServerKind::kStored));
     unwanted.push_back(oneRun(options, ServerKind::kUnwanted));
   }

@@ -25,14 +25,13 @@ std::unique_ptr<Process> Server::start(const ServerPrograms& programs,
                                      std::vector<std::string>{});
   }
   const std::string config = directory_.path() + "/halvox.toml";
-  std::ofstream(config)
-      << "[listener]\nsocket = \"" << socket_ << "\"\n[storage]\ndirectory = \""
-      << directory_.path() << "/state\"\nmax_megabytes = 8192\n"
-      << "[analytics]\nwanted = [" << (kind_ == ServerKind::kUnwanted ? "" : "\"*\"")
-      << "]\n[limits]\nclient_history_megabytes = 65536\n"
-      << "client_sessions = 1000000\n[log]\nlevel = \"error\"\n[link]\nbackend = \""
-      << (kind_ == ServerKind::kLinked ? "local" : "none") << "\"\n"
-      << settings;
+  std::ofstream(config) << "[listener]\nsocket = \"" << socket_ << "\"\n[storage]\ndirectory = \""
+                        << directory_.path() << "/state\"\nmax_megabytes = 8192\n"
+                        << "[analytics]\nwanted = ["
+                        << (kind_ == ServerKind::kStored ? "\"*\"" : "")
+                        << "]\n[limits]\nclient_history_megabytes = 65536\n"
+                        << "client_sessions = 1000000\n[log]\nlevel = \"error\"\n"
+                        << settings;
   return std::make_unique<Process>(std::vector<std::string>{programs.service},
                                    std::vector<std::string>{"HALVOX_CONFIG=" + config});
 }

@@ -9,12 +9,11 @@
 
 namespace halvox::bench {
 
-enum class ServerKind : std::uint8_t {
-  kEcho,
-  kLinked,    // the service that stores both events of each message and its message of the link
-  kStored,    // both events, no link
-  kUnwanted,  // neither
-};
+// The echo, the service with both events of each message stored, the service with none wanted.
+enum class ServerKind : std::uint8_t { kEcho, kStored, kUnwanted };
+
+inline constexpr const char* kNoLink = "[link]\nbackend = \"none\"\n";
+inline constexpr const char* kLocalLink = "[link]\nbackend = \"local\"\n";
 
 struct ServerPrograms {
   std::string service;
@@ -24,8 +23,9 @@ struct ServerPrograms {
 // A server of some kind with a directory of its own, which goes with it.
 class Server {
  public:
-  // `settings` are tables that are added to the service's configuration.
-  Server(const ServerPrograms& programs, ServerKind kind, const std::string& settings = {});
+  // `settings` are tables that are added to the configuration, that of the link among them.
+  // them.
+  Server(const ServerPrograms& programs, ServerKind kind, const std::string& settings = kNoLink);
 
   // A client with a started session, and one without any.
   [[nodiscard]] std::unique_ptr<LoadClient> client(std::int64_t reporter) const;

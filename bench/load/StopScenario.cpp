@@ -54,13 +54,12 @@ class OtherClient {
 };
 
 struct Build {
-  ServerKind kind;
   std::string name;
   std::string settings;
 };
 
 void measure(const LoadOptions& options, const Build& build, std::vector<Measurement>& results) {
-  const Server server(options.programs, build.kind, build.settings);
+  const Server server(options.programs, ServerKind::kStored, build.settings);
   const auto client = server.client(1);
   client->pipeline(kHistory, options.window, options.shape);
   server.process().waitForRest();
@@ -94,12 +93,12 @@ void measure(const LoadOptions& options, const Build& build, std::vector<Measure
 }  // namespace
 
 void measureStop(const LoadOptions& options, std::vector<Measurement>& results) {
-  measure(options, {ServerKind::kStored, "stop of 1,000,000 messages, no link", ""}, results);
-  measure(options, {ServerKind::kLinked, "stop of 1,000,000 messages", ""}, results);
-  measure(
-      options,
-      {ServerKind::kLinked, "the same on an internal build", "[device]\nInternalBuild = true\n"},
-      results);
+  measure(options, {"stop of 1,000,000 messages, no link", kNoLink}, results);
+  measure(options, {"stop of 1,000,000 messages", kLocalLink}, results);
+  measure(options,
+          {"the same on an internal build",
+           std::string(kLocalLink) + "[device]\nInternalBuild = true\n"},
+          results);
 }
 
 }  // namespace halvox::bench
