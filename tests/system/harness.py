@@ -195,6 +195,34 @@ class Service:
         return total
 
 
+class Follower:
+    """A halvoxctl that shows stored records as they come, one JSON object a line."""
+
+    def __init__(self, service, command):
+        self._process = subprocess.Popen(
+            [*WITH_US, str(CTL), command, "--follow", "--json"], stdin=subprocess.DEVNULL,
+            stdout=subprocess.PIPE, env={**os.environ, "HALVOX_CONFIG": str(service.config)})
+        os.set_blocking(self._process.stdout.fileno(), False)
+        self._bytes = b""
+
+    def records(self, count):
+        """All records so far, once there are that many."""
+        def shown():
+            self._bytes += self._process.stdout.read() or b""
+            lines = self._bytes.decode().split("\n")[:-1]
+            return lines if len(lines) >= count else None
+        return [json.loads(line) for line in wait_for(f"{count} records", shown)]
+
+    def leave(self):
+        """Reads no more; the exit status with which the program ends then."""
+        self._process.stdout.close()
+        return self._process.wait(DEADLINE)
+
+    def close(self):
+        self._process.stdout.close()
+        stop_process(self._process)
+
+
 class Client:
     """A client in GLib's own D-Bus implementation, over our socket or over a bus."""
 

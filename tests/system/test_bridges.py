@@ -5,7 +5,7 @@ import json
 import sqlite3
 import unittest
 
-from harness import Service, wait_for
+from harness import Follower, Service, wait_for
 
 ISSUE_DETECTOR = 7
 JOULEBOOK = 8
@@ -57,6 +57,43 @@ class BridgesTest(unittest.TestCase):
         self.assertGreater(engine.pop("TimestampEnd"), 0)
         self.assertEqual(engine, {"EngineOnDuration": 4.5, "ApplicationName": "Unknown"})
         self.assertEqual(leak, {"Haptic_Active_Hardware_Time_Seconds": 30, "Active_Clients": 2})
+
+    def follow(self, command):
+        follower = Follower(self.service, command)
+        self.addCleanup(follower.close)
+        return follower
+
+    def test_metrics_are_followed_as_they_come(self):
+        def send(node):
+            self.client.send({"issue_type": "glitch", "rtaid_client": "x", "node": node,
+                              "any_channel_silence_seconds": 3},
+                             event_type=ISSUE_DETECTOR, reporters=[7])
+
+        send("one")
+        follower = self.follow("metrics")
+        self.assertEqual(follower.records(1)[0]["fields"],
+                         {"issue_type": "glitch", "node": "one", "rtaid_client": "x", "duration": 3})
+        # Each of these is only sent when what was sent before has been shown.
+        for shown, node in enumerate(("two", "three"), 2):
+            send(node)
+            records = follower.records(shown)
+            self.assertEqual(records[-1]["fields"]["node"], node)
+        self.assertEqual([record["fields"]["node"] for record in records], ["one", "two", "three"])
+        self.assertEqual({record["metric_id"] for record in records}, {METRIC})
+        self.assertEqual(follower.leave(), 0)
+
+    def test_power_events_are_followed_as_they_come(self):
+        self.client.send({"EngineOnTime": 1}, event_type=JOULEBOOK, reporters=[7])
+        follower = self.follow("power")
+        follower.records(1)
+        self.client.send({"Haptic_Active_Hardware_Time_Seconds": 2}, event_type=JOULEBOOK, reporters=[7])
+        records = follower.records(2)
+
+        self.assertEqual([(record["category_id"], record["event_name"]) for record in records],
+                         [(POWER_LOG, "Oxbow_Haptics"), (POWER_LOG, "LeakedHapticsSessionInfo")])
+        self.assertEqual(records[0]["payload"]["EngineOnDuration"], 1)
+        self.assertEqual(records[1]["payload"], {"Haptic_Active_Hardware_Time_Seconds": 2})
+        self.assertEqual(follower.leave(), 0)
 
     def test_other_messages_leave_no_metric_and_no_power_event(self):
         self.client.send({"issue_type": "glitch", "EngineOnTime": 4.5}, reporters=[7])

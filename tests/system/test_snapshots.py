@@ -1,14 +1,17 @@
 """Leaked haptics sessions make an internal build capture diagnostics, and nothing else does."""
 
+import contextlib
 import json
 import re
+import signal
+import sqlite3
 import subprocess
 import time
 import unittest
 from pathlib import Path
 
 import harness
-from harness import CTL, Service, require, wait_for
+from harness import CTL, Follower, Service, require, wait_for
 
 SESSION_GENERIC = 0x08000001
 JOULEBOOK = 8
@@ -24,8 +27,23 @@ def report(seconds):
 
 
 def snapshots(service):
-    """The archives that are there, oldest first; those in work have other names."""
+    """The archives that are there, by name; those in work have other names."""
     return sorted((service.directory / "state" / "snapshots").glob("*.tar.zst"))
+
+
+def answers(service):
+    """How many requests for snapshots were answered; the next one is taken in after an answer."""
+    return service.log().count("Response from ailmentReporter")
+
+
+def counters(service):
+    """What the running service counted of its snapshots, by name."""
+    said = len(service.log())
+    service.process.send_signal(signal.SIGUSR1)
+    # Pieces come in the order of their names, so these are the last lines.
+    wait_for("the counters", lambda: "counted snapshots, stored: " in service.log()[said:])
+    return {name: int(value) for name, value
+            in re.findall(r"counted diagnostics, (.+): (\d+)$", service.log()[said:], re.MULTILINE)}
 
 
 class HapticsClient:
@@ -51,9 +69,8 @@ class Snapshots(unittest.TestCase):
         haptics.send(report(1))
         self.assertEqual(snapshots(service), [])
         haptics.send(report(2))
-        begun = time.monotonic()
-        wait_for("a snapshot", lambda: snapshots(service), WITHIN)
-        self.assertLess(time.monotonic() - begun, WITHIN)
+        wait_for("an answer", lambda: answers(service) == 1)
+        self.assertEqual(len(snapshots(service)), 1, service.log())
         return haptics, snapshots(service)[0]
 
     def test_two_reports_leave_one_readable_archive_with_the_signature(self):
@@ -105,8 +122,32 @@ class Snapshots(unittest.TestCase):
         line = wait_for("the reply", lambda: next(
             (line for line in service.log().splitlines() if "Response from ailmentReporter" in line), None))
         self.assertIn(str(archive), line)
-        self.assertIn("size_bytes", line)
-        self.assertIn("seconds", line)
+        self.assertIn(f"size_bytes = {archive.stat().st_size}", line)
+        # As the service measured it: from taking the request to the file that has its name.
+        self.assertLess(float(re.search(r" seconds = ([0-9.e-]+)", line)[1]), WITHIN)
+
+    def test_snapshot_is_recorded_and_followed(self):
+        service = self.service(INTERNAL)
+        haptics, first = self.take_one(service)
+        follower = Follower(service, "snapshots")
+        self.addCleanup(follower.close)
+        self.assertEqual(follower.records(1)[0]["path"], str(first))
+
+        haptics.send(report(3))
+        haptics.send(report(4))
+        records = follower.records(2)
+
+        self.assertEqual(records[0]["path"], str(first))
+        self.assertCountEqual([record["path"] for record in records],
+                              [str(path) for path in snapshots(service)])
+        for record in records:
+            self.assertEqual(record["signature"]["DetectedProcess"], OWN_NAME)
+        self.assertEqual(follower.leave(), 0)
+        with contextlib.closing(sqlite3.connect(f"file:{service.database}?mode=ro", uri=True)) as store:
+            stored = store.execute("SELECT time, signature, path FROM snapshots ORDER BY time").fetchall()
+        self.assertEqual([(json.loads(signature)["SubtypeContext"], path) for _, signature, path in stored],
+                         [("Joulebook", record["path"]) for record in records])
+        self.assertLess(abs(stored[0][0] - first.stat().st_mtime), 2 * WITHIN)
 
     def test_other_builds_never_take_one(self):
         for config in (NOT_INTERNAL, ""):
@@ -138,39 +179,40 @@ class Snapshots(unittest.TestCase):
         haptics = HapticsClient(service)
         other = service.client()
         directory = service.directory / "state" / "snapshots"
-        slowest = 0.0
+        waited = []
         most_in_work = 0
         for number in range(10_000):
             haptics.send(report(number))
             if number % 100 == 0:
                 begun = time.monotonic()
                 other.valid(7)
-                slowest = max(slowest, time.monotonic() - begun)
+                waited.append(time.monotonic() - begun)
                 most_in_work = max(most_in_work, len(list(directory.glob(".*"))))
 
         self.assertLessEqual(most_in_work, 1)
-        self.assertLess(slowest, 1.0)
-        wait_for("an end of the last snapshot",
-                 lambda: snapshots(service) and not list(directory.glob(".*")), WITHIN)
+        # A busy machine may hold up some answers, but not most.
+        self.assertLess(sorted(waited)[len(waited) * 3 // 4], 1.0, waited)
         # Two reports ask once; each was taken or refused, and told so.
+        counted = wait_for("an end of the last snapshot", lambda: next(
+            (now for now in [counters(service)]
+             if now["delivered"] + now["dropped: another in work"] == 5000), None), pause=0.2)
+        self.assertEqual(counted["received"], 5000)
+        self.assertGreater(counted["delivered"], 0)
+        # Requests went on while one was in work.
+        self.assertGreater(counted["dropped: another in work"], 0)
         self.assertEqual(service.stop(), 0)
-        counted = dict(re.findall(r"counted diagnostics, (.+): (\d+)$", service.log(), re.MULTILINE))
-        taken = int(counted.pop("delivered"))
-        self.assertEqual(counted.pop("received"), "5000")
-        self.assertEqual(set(counted), {"dropped: another in work"})
-        self.assertEqual(taken + int(counted["dropped: another in work"]), 5000)
-        self.assertEqual(len(snapshots(service)), min(taken, 20))
+        self.assertEqual(len(snapshots(service)), min(counted["delivered"], 20))
 
     def test_only_so_many_are_kept_as_the_configuration_says(self):
         service = self.service(INTERNAL + "[diagnostics]\nkeep_snapshots = 2\n")
         haptics, first = self.take_one(service)
         for number in range(3):
-            before = service.log().count("snapshot taken: ")
+            before = answers(service)
             haptics.send(report(100 + 2 * number))
             haptics.send(report(101 + 2 * number))
-            wait_for("the next snapshot",
-                     lambda: service.log().count("snapshot taken: ") > before, WITHIN)
+            wait_for("the next answer", lambda: answers(service) > before)
 
+        self.assertEqual(service.log().count("snapshot taken: "), 4)
         self.assertEqual(len(snapshots(service)), 2)
         self.assertNotIn(first, snapshots(service))
 
@@ -181,14 +223,14 @@ class Snapshots(unittest.TestCase):
         haptics = HapticsClient(service)
         haptics.send(report(1))
         haptics.send(report(2))
-        wait_for("an error line", lambda: "no snapshot was taken" in service.log(), WITHIN)
-        wait_for("the reply", lambda: "Response from ailmentReporter" in service.log(), WITHIN)
+        wait_for("an error line", lambda: "no snapshot was taken" in service.log())
+        wait_for("the answer", lambda: answers(service) == 1)
 
         place.unlink()
         haptics.send(report(3))
         haptics.send(report(4))
 
-        wait_for("a snapshot", lambda: snapshots(service), WITHIN)
+        wait_for("a snapshot", lambda: snapshots(service))
 
     def test_end_in_the_middle_leaves_nothing_in_work(self):
         service = self.service(INTERNAL)
