@@ -233,6 +233,7 @@ void LinuxPlatform::logStart() const {
   kLog.notice("link: ", linkName(configuration_.link.backend), ", in this build: local, ",
               isNatsBuilt() ? "nats, " : "", "none");
   kLog.notice("trace points: ", kdebugFailure_.empty() ? "LTTng" : "none, LTTng " + kdebugFailure_);
+  kLog.notice("traces: ", traces_->description());
 }
 
 void LinuxPlatform::logStatistics(LogLevel level, Counters counters) const {

@@ -17,7 +17,26 @@ constexpr int kNotStarted = 1;
 constexpr int kNoRange = 2;
 constexpr std::size_t kBatchEvents = 4096;
 
-using Batch = std::vector<trace_point>;
+// Events on their way to the queue. They are counted as dropped when they go undelivered: the queue
+// has ended with the service.
+class Batch {
+ public:
+  explicit Batch(Counter& dropped) : dropped_(dropped) {}
+  Batch(const Batch&) = delete;
+  Batch& operator=(const Batch&) = delete;
+  ~Batch() { dropped_.add(points_.size()); }
+
+  void add(const trace_point& point) {
+    if (points_.empty()) points_.reserve(kBatchEvents);
+    points_.push_back(point);
+  }
+  [[nodiscard]] std::size_t size() const { return points_.size(); }
+  [[nodiscard]] std::vector<trace_point> take() { return std::exchange(points_, {}); }
+
+ private:
+  Counter& dropped_;
+  std::vector<trace_point> points_;
+};
 
 struct Range {
   std::uint32_t low = 0;
@@ -49,8 +68,8 @@ class LttngKtraceSession final : public KtraceSession {
     return text;
   }
 
-  void deliver(const Batch& batch) const {
-    for (const trace_point& point : batch) {
+  void deliver(const std::vector<trace_point>& points) const {
+    for (const trace_point& point : points) {
       for (const Range& range : ranges) {
         const bool isWanted = point.debugid >= range.low && point.debugid <= range.high;
         if (isWanted && range.handler) range.handler(point);
@@ -91,8 +110,11 @@ LttngKtraceService::LttngKtraceService(LttngControl& control, StatisticsService&
     : control_(control),
       started_(statistics.counter("kernel traces", "traces started")),
       failed_(statistics.counter("kernel traces", "traces that failed")),
+      read_(statistics.counter("kernel traces", "events read back")),
       delivered_(statistics.counter("kernel traces", "events delivered")),
-      lost_(statistics.counter("kernel traces", "events lost by the tracer")) {}
+      dropped_(statistics.counter("kernel traces", "events dropped: the service ends")),
+      lost_(statistics.counter("kernel traces", "events lost by the tracer")),
+      lostPackets_(statistics.counter("kernel traces", "packets lost by the tracer")) {}
 
 void LttngKtraceService::stop() { gate_.stop(); }
 
@@ -170,29 +192,29 @@ void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& sessi
 }
 
 void LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& session) {
-  auto batch = std::make_shared<Batch>();
+  auto batch = std::make_shared<Batch>(dropped_);
   const auto deliver = [&] {
-    if (batch->empty()) return;
-    if (!gate_.enter()) return batch->clear();
-    delivered_.add(batch->size());
-    auto full = std::exchange(batch, std::make_shared<Batch>());
-    batch->reserve(kBatchEvents);
+    auto full = std::exchange(batch, std::make_shared<Batch>(dropped_));
+    if (full->size() == 0 || !gate_.enter()) return;
     session->queue->async(JobWeight::kMayBlock, [this, session, full = std::move(full)] {
-      session->deliver(*full);
+      const std::vector<trace_point> points = full->take();
+      delivered_.add(points.size());
+      session->deliver(points);
       gate_.leave();
     });
   };
-  const TraceReading reading =
-      readTraces(session->recording->directory,
-                 {.onClock = [&](const TraceClock& clock) { session->clock = clock; },
-                  .onEvent =
-                      [&](const trace_point& point) {
-                        batch->push_back(point);
-                        if (!session->hasWalltimes) batch->back().walltime = 0;
-                        if (batch->size() == kBatchEvents) deliver();
-                      }});
+  const auto take = [&](trace_point point) {
+    if (!session->hasWalltimes) point.walltime = 0;
+    batch->add(point);
+    if (batch->size() == kBatchEvents) deliver();
+  };
+  const TraceReading reading = readTraces(
+      session->recording->directory,
+      {.onClock = [&](const TraceClock& clock) { session->clock = clock; }, .onEvent = take});
+  read_.add(reading.events);
   deliver();
   lost_.add(reading.lost);
+  lostPackets_.add(reading.lostPackets);
   if (reading.failure) kLog.error("kernel trace cannot be read back: ", *reading.failure);
   if (reading.lost + reading.lostPackets == 0) return;
   kLog.error("kernel trace lost ", reading.lost, " events and ", reading.lostPackets, " packets");

@@ -69,8 +69,11 @@ class LttngKtraceService final : public KtraceService {
   LttngControl& control_;
   Counter& started_;
   Counter& failed_;
+  Counter& read_;
   Counter& delivered_;
+  Counter& dropped_;
   Counter& lost_;
+  Counter& lostPackets_;
   DeliveryGate gate_{kBatchesAhead};
   Mutex mutex_;
   std::shared_ptr<DispatchQueue> readingQueue_ HALVOX_GUARDED_BY(mutex_);  // made when needed

@@ -62,6 +62,7 @@ struct LttngPerformanceTraceService::Work {
   Counter& started;
   Counter& failed;
   Counter& saved;
+  Counter& givenUp;
   std::uint64_t saves = 0;
 
   std::optional<Error> begin(std::optional<LttngControl::Recording>& recording) {
@@ -78,6 +79,9 @@ struct LttngPerformanceTraceService::Work {
     return std::nullopt;
   }
 
+  // Of each trace that started and was not given up, once.
+  void count(const std::optional<Error>& error) { (error ? failed : saved).add(); }
+
   std::optional<Error> end(const LttngControl::Recording& recording) {
     auto failure = control.end(recording);
     if (!failure) return std::nullopt;
@@ -89,7 +93,6 @@ struct LttngPerformanceTraceService::Work {
     const std::string name = kTraceStart + timeText() + "-" + std::to_string(++saves) + kTraceEnd;
     const std::filesystem::path archive = control.tracesDirectory() / name;
     auto failure = packDirectory(recording.directory, archive);
-    (failure ? failed : saved).add();
     if (failure) return traceError("cannot save the trace: " + *failure);
     removeOldTraces(control.tracesDirectory());
     url = "file://" + archive.string();
@@ -111,6 +114,7 @@ class LttngTraceSession final : public KQTraceSession,
   ~LttngTraceSession() override {
     if (!recording_.has_value()) return;
     queue_->async(JobWeight::kMayBlock, [work = work_, recording = std::move(*recording_)] {
+      work->givenUp.add();
       static_cast<void>(work->end(recording));
       work->control.discard(recording);
     });
@@ -148,6 +152,7 @@ class LttngTraceSession final : public KQTraceSession,
     const auto saveError = work_->save(recording, url);
     work_->control.discard(recording);
     if (!error) error = saveError;
+    work_->count(error);
     if (error) kLog.error("performance trace failed: ", error->description);
     if (const auto listener = delegate()) listener->kqTraceDidComplete(url, 0, error);
   }
@@ -167,7 +172,8 @@ LttngPerformanceTraceService::LttngPerformanceTraceService(LttngControl& control
           Work{.control = control,
                .started = statistics.counter("performance traces", "traces started"),
                .failed = statistics.counter("performance traces", "traces that failed"),
-               .saved = statistics.counter("performance traces", "traces saved")})) {}
+               .saved = statistics.counter("performance traces", "traces saved"),
+               .givenUp = statistics.counter("performance traces", "traces given up")})) {}
 
 void LttngPerformanceTraceService::close() {
   const MutexLock lock(mutex_);

@@ -18,8 +18,6 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr std::chrono::seconds kAnswersWithin{10};
-constexpr std::chrono::seconds kEndsWithin{5};
 constexpr std::chrono::milliseconds kLookEvery{10};  // at a process that tells nobody
 
 // 0 and the process, or the system's error.
@@ -83,10 +81,11 @@ bool SessionDaemon::isNoted() const {
 void SessionDaemon::adopt() {
   Process process;
   std::ifstream file(noteFile_);
-  if (!(file >> process.pid >> process.startTime) || process.pid <= 1) return;
-  process_ = std::move(process);
-  if (isAlive()) return;
-  process_.reset();
+  if (file >> process.pid >> process.startTime && process.pid > 1) {
+    process_ = std::move(process);
+    if (isAlive()) return;
+    process_.reset();
+  }
   std::error_code ignored;
   std::filesystem::remove(noteFile_, ignored);
 }
@@ -96,7 +95,7 @@ void SessionDaemon::note() const {
 }
 
 std::optional<std::string> SessionDaemon::start() {
-  process_.reset();
+  end();
   Process process{.pid = 0, .startTime = {}, .isChild = true};
   if (const int error = spawnDaemon(process.pid)) {
     return std::string("cannot start lttng-sessiond: ") + std::generic_category().message(error);
@@ -104,7 +103,7 @@ std::optional<std::string> SessionDaemon::start() {
   process.startTime = startTimeOf(process.pid);
   process_ = std::move(process);
   note();
-  const auto deadline = std::chrono::steady_clock::now() + kAnswersWithin;
+  const auto deadline = std::chrono::steady_clock::now() + limits_.answersWithin;
   while (::lttng_session_daemon_alive() != 1) {
     const bool isGone = !isAlive();
     if (isGone || std::chrono::steady_clock::now() > deadline) {
@@ -116,14 +115,21 @@ std::optional<std::string> SessionDaemon::start() {
   return std::nullopt;
 }
 
-void SessionDaemon::end() {
-  if (!process_.has_value()) return;
-  const auto deadline = std::chrono::steady_clock::now() + kEndsWithin;
-  if (isAlive()) ::kill(process_->pid, SIGTERM);
-  while (isAlive() && std::chrono::steady_clock::now() < deadline) {
+bool SessionDaemon::isGoneSoon() const {
+  const auto deadline = std::chrono::steady_clock::now() + limits_.endsWithin;
+  while (isAlive()) {
+    if (std::chrono::steady_clock::now() > deadline) return false;
     std::this_thread::sleep_for(kLookEvery);
   }
-  if (isAlive()) ::kill(process_->pid, SIGKILL);
+  return true;
+}
+
+void SessionDaemon::end() {
+  if (!process_.has_value()) return;
+  for (const int signal : {SIGTERM, SIGKILL}) {
+    if (isAlive()) ::kill(process_->pid, signal);
+    if (isGoneSoon()) break;
+  }
   process_.reset();
   std::error_code ignored;
   std::filesystem::remove(noteFile_, ignored);

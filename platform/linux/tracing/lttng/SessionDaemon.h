@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <filesystem>
 #include <optional>
 #include <string>
@@ -14,13 +15,21 @@ namespace halvox::platform::linux_ {
 // its daemon too. A process is signalled only while its start time is the one that was noted.
 class SessionDaemon {
  public:
-  // The file is in a directory that exists before the daemon is started.
-  explicit SessionDaemon(std::filesystem::path noteFile) : noteFile_(std::move(noteFile)) {}
+  struct Limits {
+    std::chrono::milliseconds answersWithin{10'000};
+    std::chrono::milliseconds endsWithin{5'000};  // of a signal; then it is killed
+  };
 
-  // Takes over the daemon that the file names, if it still runs.
+  // The file is in a directory that exists before the daemon is started.
+  explicit SessionDaemon(std::filesystem::path noteFile) : SessionDaemon(std::move(noteFile), {}) {}
+  SessionDaemon(std::filesystem::path noteFile, Limits limits)
+      : noteFile_(std::move(noteFile)), limits_(limits) {}
+
+  // Takes over the daemon that the file names, if it still runs; otherwise the file goes.
   void adopt();
   [[nodiscard]] bool isNoted() const;
-  // Starts the daemon and waits until it answers; or tells why not.
+  // Ends the daemon that was ours and does not answer any more, starts another and waits until it
+  // answers; or ends it and tells why not.
   [[nodiscard]] std::optional<std::string> start();
   [[nodiscard]] bool isOurs() const { return process_.has_value(); }
   // Ends the daemon, if it is ours, and waits until it is gone.
@@ -35,9 +44,11 @@ class SessionDaemon {
 
   [[nodiscard]] static std::string startTimeOf(pid_t pid);
   [[nodiscard]] bool isAlive() const;
+  [[nodiscard]] bool isGoneSoon() const;
   void note() const;
 
   const std::filesystem::path noteFile_;
+  const Limits limits_;
   std::optional<Process> process_;
 };
 

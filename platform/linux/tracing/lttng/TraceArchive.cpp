@@ -87,7 +87,7 @@ Failure write(const std::filesystem::path& directory, int file) {
 
 Failure packDirectory(const std::filesystem::path& directory,
                       const std::filesystem::path& archive) {
-  const std::filesystem::path unfinished = archive.string() + ".unfinished";
+  const std::filesystem::path unfinished = directory.string() + ".unfinished";
   constexpr int kFlags = O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW;
   const UniqueFd file(::open(unfinished.c_str(), kFlags, kArchivePermissions));
   if (!file) return systemFailure(unfinished);

@@ -1,0 +1,167 @@
+#include "platform/linux/tracing/lttng/SessionDaemon.h"
+
+#include <array>
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <stdexcept>
+#include <string>
+
+#include <gtest/gtest.h>
+#include <lttng/lttng.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+namespace fs = std::filesystem;
+
+// Scripts of a directory that is all of PATH take the daemon's place; no tracer is met.
+class SessionDaemonTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    ::setenv("PATH", scratch_.c_str(), 1);
+    ::setenv("LTTNG_HOME", scratch_.c_str(), 1);
+    ::setenv("HOME", scratch_.c_str(), 1);
+    if (::lttng_session_daemon_alive() == 1) GTEST_SKIP() << "a tracer's daemon of root's runs";
+  }
+  ~SessionDaemonTest() override {
+    ::setenv("PATH", path_.c_str(), 1);
+    std::error_code ignored;
+    fs::remove_all(scratch_, ignored);
+  }
+
+  static fs::path makeScratch() {
+    std::string pattern = (fs::temp_directory_path() / "halvox-daemon-XXXXXX").string();
+    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
+    return pattern;
+  }
+  // The program notes its process and then does as told.
+  void writeProgram(const std::string& rest) {
+    const fs::path program = scratch_ / "lttng-sessiond";
+    std::ofstream(program) << "#!/bin/sh\necho $$ >" << pidFile_.string() << "\n" << rest << "\n";
+    fs::permissions(program, fs::perms::owner_all);
+  }
+  pid_t pid() const {
+    pid_t read = 0;
+    std::ifstream(pidFile_) >> read;
+    return read;
+  }
+  static bool isThere(pid_t pid) { return ::kill(pid, 0) == 0; }
+  static std::string startTimeOf(pid_t pid) {
+    std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
+    std::string field;
+    for (int number = 0; number < 22; ++number) file >> field;
+    return field;
+  }
+  // A process of ours that waits to be ended.
+  static pid_t startSleeper() {
+    const pid_t child = ::fork();
+    if (child == 0) {
+      ::execl("/bin/sleep", "sleep", "1000", nullptr);
+      ::_exit(127);
+    }
+    return child;
+  }
+
+  const std::string path_ = ::getenv("PATH");
+  const fs::path scratch_ = makeScratch();
+  const fs::path note_ = scratch_ / "note";
+  const fs::path pidFile_ = scratch_ / "pid";
+  SessionDaemon daemon_{note_,
+                        {.answersWithin = std::chrono::milliseconds(300),
+                         .endsWithin = std::chrono::milliseconds(100)}};
+};
+
+TEST_F(SessionDaemonTest, ProgramThatIsMissingIsTold) {
+  EXPECT_EQ(daemon_.start(), "cannot start lttng-sessiond: No such file or directory");
+
+  EXPECT_FALSE(daemon_.isOurs());
+  EXPECT_FALSE(daemon_.isNoted());
+}
+
+TEST_F(SessionDaemonTest, DaemonThatEndsAtOnceIsToldBeforeTheTimeIsUp) {
+  writeProgram("exit 1");
+  SessionDaemon patient(note_, {.answersWithin = std::chrono::hours(1)});
+
+  EXPECT_EQ(patient.start(), "lttng-sessiond ended at once");
+
+  EXPECT_FALSE(patient.isOurs());
+  EXPECT_FALSE(patient.isNoted());
+}
+
+TEST_F(SessionDaemonTest, DaemonThatDoesNotAnswerIsEndedAndTold) {
+  writeProgram("exec /bin/sleep 1000");
+
+  EXPECT_EQ(daemon_.start(), "lttng-sessiond does not answer");
+
+  EXPECT_FALSE(daemon_.isOurs());
+  EXPECT_FALSE(daemon_.isNoted());
+  ASSERT_GT(pid(), 1);
+  EXPECT_FALSE(isThere(pid()));
+}
+
+TEST_F(SessionDaemonTest, DaemonThatDoesNotHeedItsSignalIsKilled) {
+  writeProgram("trap '' TERM; exec /bin/sleep 1000");
+
+  EXPECT_EQ(daemon_.start(), "lttng-sessiond does not answer");
+
+  ASSERT_GT(pid(), 1);
+  EXPECT_FALSE(isThere(pid()));
+}
+
+TEST_F(SessionDaemonTest, DaemonThatWasNotedIsKnownAgainAndEnded) {
+  const pid_t sleeper = startSleeper();
+  std::ofstream(note_) << sleeper << ' ' << startTimeOf(sleeper) << '\n';
+
+  daemon_.adopt();
+  EXPECT_TRUE(daemon_.isOurs());
+  daemon_.end();
+
+  EXPECT_FALSE(daemon_.isOurs());
+  EXPECT_FALSE(daemon_.isNoted());
+  int status = 0;
+  ASSERT_EQ(::waitpid(sleeper, &status, 0), sleeper);
+  EXPECT_TRUE(WIFSIGNALED(status) && WTERMSIG(status) == SIGTERM);
+}
+
+TEST_F(SessionDaemonTest, DaemonThatDoesNotAnswerAnyMoreIsEndedBeforeAnotherIsStarted) {
+  const pid_t sleeper = startSleeper();
+  std::ofstream(note_) << sleeper << ' ' << startTimeOf(sleeper) << '\n';
+  daemon_.adopt();
+
+  EXPECT_NE(daemon_.start(), std::nullopt);
+
+  EXPECT_EQ(::waitpid(sleeper, nullptr, WNOHANG), sleeper);
+}
+
+TEST_F(SessionDaemonTest, OtherProcessThatGotTheNumberIsLeftAlone) {
+  const pid_t sleeper = startSleeper();
+  std::ofstream(note_) << sleeper << " 1\n";
+
+  daemon_.adopt();
+  EXPECT_FALSE(daemon_.isOurs());
+  EXPECT_FALSE(daemon_.isNoted());
+  daemon_.end();
+
+  EXPECT_EQ(::waitpid(sleeper, nullptr, WNOHANG), 0);
+  ::kill(sleeper, SIGKILL);
+  ::waitpid(sleeper, nullptr, 0);
+}
+
+TEST_F(SessionDaemonTest, NoteThatNamesNoProcessGoes) {
+  for (const char* text : {"", "x", "0 1", "-1 1", "1 1", "5"}) {
+    std::ofstream(note_) << text;
+
+    daemon_.adopt();
+
+    EXPECT_FALSE(daemon_.isOurs()) << text;
+    EXPECT_FALSE(daemon_.isNoted()) << text;
+  }
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

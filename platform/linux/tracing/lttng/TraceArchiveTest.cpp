@@ -1,0 +1,92 @@
+#include "platform/linux/tracing/lttng/TraceArchive.h"
+
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <random>
+#include <stdexcept>
+#include <string>
+
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+namespace fs = std::filesystem;
+
+class TraceArchiveTest : public testing::Test {
+ protected:
+  TraceArchiveTest() {
+    fs::create_directories(directory_);
+    fs::create_directories(archives_);
+    // So little of it can be packed that it does not fit where the tests make it too large.
+    std::ofstream file(directory_ / "stream");
+    std::mt19937_64 random(1);
+    for (int word = 0; word < 100'000; ++word) file << random();
+  }
+  ~TraceArchiveTest() override {
+    std::error_code ignored;
+    fs::remove_all(scratch_, ignored);
+  }
+
+  static fs::path makeScratch() {
+    std::string pattern = (fs::temp_directory_path() / "halvox-archive-XXXXXX").string();
+    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
+    return pattern;
+  }
+  // No file of this process grows beyond that.
+  static void limitFiles() {
+    const rlimit limit{.rlim_cur = 65'536, .rlim_max = 65'536};
+    ::setrlimit(RLIMIT_FSIZE, &limit);
+  }
+  static bool isEmpty(const fs::path& directory) { return fs::is_empty(directory); }
+
+  const fs::path scratch_ = makeScratch();
+  const fs::path directory_ = scratch_ / "recordings/one";
+  const fs::path archives_ = scratch_ / "archives";
+  const fs::path archive_ = archives_ / "one.tar.zst";
+};
+
+TEST_F(TraceArchiveTest, WholeArchiveHasItsNameAndNothingElseIsLeft) {
+  EXPECT_EQ(packDirectory(directory_, archive_), std::nullopt);
+
+  EXPECT_GT(fs::file_size(archive_), 100'000U);
+  EXPECT_EQ(std::distance(fs::directory_iterator(archives_), {}), 1);
+  EXPECT_EQ(std::distance(fs::directory_iterator(directory_.parent_path()), {}), 1);
+}
+
+TEST_F(TraceArchiveTest, ProcessThatIsKilledLeavesNothingBesideTheFinishedArchives) {
+  const auto packAndBeKilled = [this] {
+    limitFiles();
+    (void)packDirectory(directory_, archive_);
+  };
+
+  EXPECT_EXIT(packAndBeKilled(), testing::KilledBySignal(SIGXFSZ), "");
+
+  EXPECT_TRUE(isEmpty(archives_));
+}
+
+TEST_F(TraceArchiveTest, FileThatCannotBeWrittenIsToldAndLeavesNothing) {
+  const auto fail = [this] {
+    std::signal(SIGXFSZ, SIG_IGN);
+    limitFiles();
+    const auto failure = packDirectory(directory_, archive_);
+    const bool isTold = failure.has_value() && !failure->empty();
+    std::_Exit(isTold && isEmpty(archives_) ? 0 : 1);
+  };
+
+  EXPECT_EXIT(fail(), testing::ExitedWithCode(0), "");
+
+  EXPECT_EQ(std::distance(fs::directory_iterator(directory_.parent_path()), {}), 1);
+}
+
+TEST_F(TraceArchiveTest, DirectoryThatIsMissingIsTold) {
+  EXPECT_NE(packDirectory(scratch_ / "recordings/none", archive_), std::nullopt);
+
+  EXPECT_TRUE(isEmpty(archives_));
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_
