@@ -3,6 +3,8 @@
 //
 //   halvox_trace_client intervals PAIRS    four threads, each its own spacing
 //   halvox_trace_client flood EVENTS RATE  pairs from two threads, so many events a second in all
+//   halvox_trace_client burst EVENTS       says "ready", waits for a line on standard input, and
+//                                          emits pairs from one thread as fast as it can
 
 #include <array>
 #include <chrono>
@@ -28,8 +30,8 @@ constexpr std::uint32_t kCrossEnd = 0x2104001C;
 constexpr std::uint32_t kOwnBegin = 0x21040020;  // of thread n: n * kOwnStep further
 constexpr std::uint32_t kOwnEnd = 0x21040024;
 constexpr std::uint32_t kOwnStep = 8;
-constexpr std::uint32_t kOutsideBegin = 0x2104408C;  // behind what the service records
-constexpr std::uint32_t kOutsideEnd = 0x21044090;
+constexpr std::uint32_t kFirst = 0x21040000;  // of what the service records
+constexpr std::uint32_t kLast = 0x2104408A;
 constexpr std::chrono::microseconds kSpacing{500};
 
 void emit(std::uint32_t code) { halvox_trace(code, 1, 2, 3, UINT64_MAX); }
@@ -38,7 +40,8 @@ std::vector<std::int64_t> measure(int thread, int pairs) {
   const std::uint32_t own = static_cast<std::uint32_t>(thread) * kOwnStep;
   std::vector<std::int64_t> measured;
   for (int pair = 0; pair < pairs; ++pair) {
-    emit(kOutsideBegin);
+    emit(kFirst - 1);
+    emit(kFirst);
     emit(kSharedBegin);
     emit(kOwnBegin + own);
     const auto begin = Clock::now();
@@ -46,7 +49,8 @@ std::vector<std::int64_t> measure(int thread, int pairs) {
     const auto end = Clock::now();
     emit(kOwnEnd + own);
     emit(kSharedEnd);
-    emit(kOutsideEnd);
+    emit(kLast);
+    emit(kLast + 1);
     measured.push_back((end - begin) / std::chrono::nanoseconds(1));
   }
   return measured;
@@ -113,6 +117,16 @@ void flood(std::int64_t events, double rate) {
             << std::endl;
 }
 
+void burst(std::int64_t events) {
+  std::cout << "ready" << std::endl;
+  std::string line;
+  std::getline(std::cin, line);
+  for (std::int64_t event = 0; event < events; event += 2) {
+    emit(kSharedBegin);
+    emit(kSharedEnd);
+  }
+}
+
 }  // namespace
 
 int main(int count, char** arguments) {
@@ -121,8 +135,10 @@ int main(int count, char** arguments) {
     intervals(std::stoi(words[1]));
   } else if (words.size() == 3 && words[0] == "flood") {
     flood(std::stoll(words[1]), std::stod(words[2]));
+  } else if (words.size() == 2 && words[0] == "burst") {
+    burst(std::stoll(words[1]));
   } else {
-    std::cerr << "usage: halvox_trace_client intervals PAIRS | flood EVENTS RATE\n";
+    std::cerr << "usage: halvox_trace_client intervals PAIRS | flood EVENTS RATE | burst EVENTS\n";
     return EXIT_FAILURE;
   }
   return EXIT_SUCCESS;

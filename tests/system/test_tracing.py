@@ -4,135 +4,28 @@ LTTng's directories are per user, and root's are the machine's own, so all of th
 unprivileged: it gives up being root for good.
 """
 
-import contextlib
 import json
 import os
-import plistlib
+import re
 import signal
 import statistics
 import subprocess
 import unittest
 from pathlib import Path
 
-from harness import BIN, CTL, DEADLINE, Service, WITH_US, require, wait_for
+from harness import BIN, CTL, DEADLINE, WITH_US, require, stop_process, wait_for
+from tracing import (CLIENT, REPORTER, THREADS, TracedService, children_of, give_up_root,
+                     is_running, start_session, traced_session, wait_for_results)
 
-CLIENT = BIN / "halvox_trace_client"
-NOBODY = 65534
-TEST = 11
-REPORTER = 7
 PAIRS = 50
-THREADS = 4
 
 
 def setUpModule():
-    require("lttng-sessiond", "lttng", "babeltrace2", "zstd")
-    if os.getuid() == 0:
-        os.setgroups([])
-        os.setgid(NOBODY)
-        os.setuid(NOBODY)
-
-
-def interval(name, begin, end, matched_by="Thread"):
-    return {"Name": name, "Type": "Interval", "KTraceCodeBegin": hex(begin),
-            "KTraceCodeEnd": hex(end), "EventsMatchedBy": matched_by}
-
-
-POINTS = [
-    interval("Shared", 0x21040010, 0x21040014),
-    interval("CrossByThread", 0x21040018, 0x2104001C),
-    interval("CrossByProcess", 0x21040018, 0x2104001C, "Process"),
-    interval("Outside", 0x2104408C, 0x21044090),
-] + [interval(f"Own{n}", 0x21040020 + 8 * n, 0x21040024 + 8 * n) for n in range(THREADS)]
-
-
-class TracedService(Service):
-    """A service with a tracer's home of its own, in which nothing runs at first."""
-
-    def __init__(self, switch="true"):
-        super().__init__(f'[features.Acoustat]\nTracing = {switch}\n[log]\nlevel = "debug"\n')
-        self.home = self.directory / "home"
-        self.home.mkdir()
-        self.environment = {"HOME": str(self.home), "LTTNG_HOME": str(self.home),
-                            "LTTNG_UST_REGISTER_TIMEOUT": "0"}
-        self._environment.update(self.environment)
-        self.params = self.directory / "params.plist"
-        self.note = self.directory / "state/traces/lttng-sessiond"
-        self.write_params(POINTS)
-
-    def write_params(self, points):
-        with open(self.params, "wb") as file:
-            plistlib.dump({"Children": [{"Name": "T", "TraceType": "ktrace", "Children": points}]},
-                          file, fmt=plistlib.FMT_BINARY)
-
-    def __exit__(self, *details):
-        daemon = self.daemon()
-        try:
-            super().__exit__(*details)
-        finally:
-            if daemon is not None:
-                with contextlib.suppress(ProcessLookupError):
-                    os.kill(daemon, signal.SIGKILL)
-
-    def daemon(self):
-        """The process of the daemon that the service started, None when there is none."""
-        with contextlib.suppress(FileNotFoundError, IndexError):
-            return int(self.note.read_text().split()[0])
-        return None
-
-    def results(self):
-        found = list(self.directory.rglob("tracing_results.ssj"))
-        return json.loads(found[0].read_text()) if found else None
-
-    def run_client(self, *arguments):
-        environment = {**os.environ, **self.environment, "LTTNG_UST_REGISTER_TIMEOUT": "10000"}
-        done = subprocess.run([*WITH_US, str(CLIENT), *map(str, arguments)], env=environment,
-                              capture_output=True, text=True, timeout=120, check=True)
-        return json.loads(done.stdout)
-
-    def sessions(self):
-        """What the tracer's daemon lists; empty when none runs."""
-        environment = {**os.environ, **self.environment}
-        return subprocess.run(["lttng", "--no-sessiond", "-n", "list"], env=environment,
-                              capture_output=True, text=True, timeout=DEADLINE).stdout
-
-    def scratch(self):
-        return list(self.directory.glob("state/traces/scratch/*"))
-
-
-def start_session(service, trace_type="ktrace"):
-    """A session of the type test that runs; gives its client."""
-    client = service.client()
-    configuration = {"HVReportingMeridelPlistFilePath": str(service.params)}
-    if trace_type is not None:
-        configuration["HVReportingTraceType"] = trace_type
-    client.create(REPORTER)
-    client.set_type(TEST, REPORTER)
-    client.configure(configuration, REPORTER)
-    client.start_later(REPORTER)
-    client.valid(REPORTER)  # is answered when the start has been carried out
-    return client
-
-
-@contextlib.contextmanager
-def traced_session(service, trace_type="ktrace"):
-    """The same, stopped at the end."""
-    client = start_session(service, trace_type)
-    yield
-    client.stop(REPORTER)
-    client.valid(REPORTER)
-    client.close()
-
-
-def wait_for_results(service):
-    return wait_for("the results file", service.results, 60)
-
-
-def is_running(pid):
-    """Whether there is such a process that has not ended; nobody may wait for an orphan here."""
-    try:
-        return ") Z " not in Path(f"/proc/{pid}/stat").read_text()
-    except FileNotFoundError:
-        return False
+    require("lttng-sessiond", "lttng", "babeltrace2", "zstd", "taskset")
+    give_up_root()
+    with TracedService() as service:
+        if not service.has_tracer():
+            raise unittest.SkipTest("LTTng is not in this build")
 
 
 class KernelTraceTest(unittest.TestCase):
@@ -168,19 +61,21 @@ class KernelTraceTest(unittest.TestCase):
             self.assertEqual(len(values["CrossByProcess"]), 1)
             self.assertGreaterEqual(values["CrossByProcess"][0], measured["cross"])
             self.assertNotIn("CrossByThread", values)
-            self.assertNotIn("Outside", values)
 
     def test_codes_outside_the_range_are_not_recorded(self):
         with TracedService() as service:
             with traced_session(service):
                 wait_for("the trace to run", service.scratch)
                 service.run_client("intervals", 10)
-            wait_for_results(service)
+            values = wait_for_results(service)["values"]
 
-            service.process.send_signal(signal.SIGUSR1)
-            # Four in each pair of the shared and of the own codes, two across threads.
-            expected = f"kernel traces, events delivered: {THREADS * 10 * 4 + 2}"
-            wait_for("the count of events", lambda: expected in service.log())
+            # The first and the last code are, and those beside them are not even read back.
+            self.assertEqual(len(values["Edges"]), THREADS * 10)
+            self.assertNotIn("Outside", values)
+            # Two each of the shared codes, the own codes and the edges, and two across threads.
+            expected = THREADS * 10 * 6 + 2
+            self.assertEqual(service.counted("events delivered"), expected)
+            self.assertEqual(service.counted("events read back"), expected)
 
     def test_nothing_is_left_of_a_trace(self):
         with TracedService() as service:
@@ -198,6 +93,42 @@ class KernelTraceTest(unittest.TestCase):
             self.assertFalse(is_running(daemon))
             self.assertFalse(service.note.exists())
 
+    def test_events_that_find_no_room_are_counted_and_told(self):
+        events = 600_000  # of which a processor's buffers hold about a third
+        processor = min(os.sched_getaffinity(0))
+        with TracedService() as service:
+            with traced_session(service):
+                daemon = service.daemon()
+                client = subprocess.Popen(
+                    [*WITH_US, "taskset", "-c", str(processor), str(CLIENT), "burst", str(events)],
+                    env=service.client_environment(), text=True,
+                    stdin=subprocess.PIPE, stdout=subprocess.PIPE)
+                try:
+                    self.assertEqual(client.stdout.readline(), "ready\n")
+                    # Nobody empties the buffers meanwhile.
+                    consumers = [pid for pid, name in children_of(daemon)
+                                 if name.startswith("lttng-consumer")]
+                    self.assertEqual(len(consumers), 1)
+                    os.kill(consumers[0], signal.SIGSTOP)
+                    try:
+                        client.stdin.write("\n")
+                        client.stdin.flush()
+                        self.assertEqual(client.wait(DEADLINE), 0)
+                    finally:
+                        os.kill(consumers[0], signal.SIGCONT)
+                finally:
+                    stop_process(client)
+                    client.stdin.close()
+                    client.stdout.close()
+            values = wait_for_results(service)["values"]
+
+            lost = service.counted("events lost by the tracer")
+            delivered = service.counted("events delivered")
+            self.assertGreater(lost, 0)
+            self.assertEqual(lost + delivered, events)
+            self.assertEqual(len(values["Shared"]), delivered // 2)
+            self.assertIn(f"kernel trace lost {lost} events and 0 packets", service.log())
+
     def test_service_that_was_killed_is_cleaned_up_after(self):
         with TracedService() as service:
             client = start_session(service)
@@ -214,6 +145,63 @@ class KernelTraceTest(unittest.TestCase):
             service.stop()
             self.assertFalse(is_running(daemon))
 
+    def test_daemon_of_somebody_else_stays(self):
+        with TracedService() as service:
+            daemon = subprocess.Popen(
+                [*WITH_US, "lttng-sessiond", "--no-kernel"],
+                env={**os.environ, **service.environment}, stdin=subprocess.DEVNULL,
+                stdout=subprocess.DEVNULL, stderr=subprocess.DEVNULL)
+            try:
+                wait_for("the daemon to answer", lambda: service.lttng("list").returncode == 0)
+                client = start_session(service)
+                service.stop(signal.SIGKILL)
+                client.close()
+                self.assertIn("halvox-", service.sessions())
+
+                service.start()
+
+                self.assertNotIn("halvox-", service.sessions())
+                with traced_session(service):
+                    service.run_client("intervals", 1)
+                self.assertIn("Own0", wait_for_results(service)["values"])
+                self.assertIsNone(service.daemon())
+                service.stop()
+                self.assertEqual(service.lttng("list").returncode, 0)
+            finally:
+                stop_process(daemon)
+
+    def test_daemon_that_others_use_outlives_the_service_and_is_known_again(self):
+        with TracedService() as service:
+            with traced_session(service):
+                daemon = service.daemon()
+            wait_for_results(service)
+            self.assertEqual(service.lttng("create", "other").returncode, 0)
+
+            service.stop()
+
+            self.assertTrue(is_running(daemon))
+            self.assertIn("other", service.sessions())
+            self.assertEqual(service.lttng("destroy", "other").returncode, 0)
+            service.start()
+            service.stop()
+            self.assertFalse(is_running(daemon))
+
+    def test_service_that_ends_while_it_reads_counts_every_event(self):
+        events = 100_000
+        with TracedService() as service:
+            client = start_session(service)
+            service.run_client("flood", events, 200_000)
+            client.call_later("stopReportingSessionForID", "x", REPORTER)
+            wait_for("the stop", lambda: "Tearing down trace" in service.log())
+            service.stop()
+            client.close()
+
+            counts = dict(re.findall(r"counted kernel traces, (.*): (\d+)", service.log()))
+            read = int(counts.get("events read back", 0))
+            handled = sum(int(counts.get(name, 0)) for name in
+                          ("events delivered", "events dropped: the service ends"))
+            self.assertEqual(handled, read)
+
     def test_without_the_feature_nothing_is_traced(self):
         with TracedService(switch="false") as service:
             with traced_session(service):
@@ -221,6 +209,22 @@ class KernelTraceTest(unittest.TestCase):
 
             self.assertIsNone(service.daemon())
             self.assertIsNone(service.results())
+
+    def test_daemon_that_dies_ends_the_trace_and_the_next_one_starts_another(self):
+        with TracedService() as service:
+            with traced_session(service):
+                daemon = service.daemon()
+                os.kill(daemon, signal.SIGKILL)
+                wait_for("its end", lambda: not is_running(daemon))
+            self.assertEqual(wait_for_results(service)["values"], {})
+            self.assertIn("kernel trace incomplete: ", service.log())
+
+            with traced_session(service):
+                self.assertNotEqual(service.daemon(), daemon)
+                service.run_client("intervals", 1)
+            wait_for("the new results", lambda: "Own0" in service.results()["values"])
+            # Nobody has to wait for the first one any more.
+            self.assertFalse(Path(f"/proc/{daemon}").exists())
 
     def test_million_events_are_read_back_without_loss(self):
         events = 1_000_000
@@ -310,6 +314,38 @@ class PerformanceTraceTest(unittest.TestCase):
             self.assertEqual(text.count("code = 0x21040010"), THREADS * 2)
             self.assertIn('procname = "halvox_trace_cl', text)
             self.assertFalse(service.scratch())
+
+    def completion_of_failed_trace(self, spoil):
+        """The line of the one completion of a trace that something happens to while it runs."""
+        with TracedService() as service:
+            client = start_session(service, trace_type=None)
+            wait_for("its start", lambda: "Performance Trace Started" in service.log())
+            spoil(service)
+            client.stop(REPORTER)  # is answered: the wait has ended
+            client.close()
+            service.stop()
+            (service.directory / "state/traces").chmod(0o755)
+            completions = re.findall("kqTraceDidComplete .*", service.log())
+            self.assertEqual(len(completions), 1)
+            self.assertNotIn("Performance Trace Completed", service.log())
+            self.assertIn("counted performance traces, traces that failed: 1", service.log())
+            return completions[0]
+
+    def test_trace_that_cannot_be_saved_completes_with_an_error(self):
+        def forbid_archives(service):
+            (service.directory / "state/traces").chmod(0o555)
+
+        completion = self.completion_of_failed_trace(forbid_archives)
+        self.assertIn("cannot save the trace: ", completion)
+
+    def test_trace_whose_daemon_dies_completes_with_an_error(self):
+        def kill_daemon(service):
+            daemon = service.daemon()
+            os.kill(daemon, signal.SIGKILL)
+            wait_for("its end", lambda: not is_running(daemon))
+
+        completion = self.completion_of_failed_trace(kill_daemon)
+        self.assertIn("cannot stop the session: ", completion)
 
 
 if __name__ == "__main__":
