@@ -121,6 +121,8 @@ TEST_F(TraceIntervalTest, CodeThatIsBeginAndEndOnlyBegins) {
     interval.processTracepoints(session_, {event(kBegin, 10), event(kBegin, 20)});
     EXPECT_FALSE(interval.hasResults());
   }
+  EXPECT_EQ(platform_.log.texts(LogLevel::kDebug), Texts{starts(1)});
+  EXPECT_EQ(platform_.log.texts(LogLevel::kDefault), Texts{starts(1)});
 }
 
 TEST_F(TraceIntervalTest, NoEventsDoNothingAndSayNothing) {

@@ -131,6 +131,7 @@ TEST_F(TraceRunnerTest, FailedRangeIsLoggedAndTheSessionStartsAllTheSame) {
   runAndStop();
 
   EXPECT_EQ(errors(), Texts{"Could not set up ktrace range, error: 22"});
+  EXPECT_THAT(platform_.journal.texts(JournalKind::kNote), testing::Contains("ktrace start"));
   EXPECT_TRUE(onlyFile().measurements.empty());
 }
 
@@ -174,6 +175,37 @@ TEST_F(TraceRunnerTest, ValuesOfOneNameAreAllWrittenAndSummedUpInOneLine) {
   EXPECT_EQ(values, (std::vector<double>{30, 10, 20}));
   EXPECT_EQ(platform_.log.texts(LogLevel::kInfo).back(),
             "Writing out 3 result for IO, min: 10, max: 30 ");
+}
+
+TEST_F(TraceRunnerTest, MeasurementsOfOneNameAreWrittenUnderItInTheOrderOfTheResults) {
+  TraceParams two = params("Startup");
+  two.tracePoints.push_back({.name = "IO", .beginCode = kBegin + 8, .endCode = kEnd + 8});
+  two.tracePoints.push_back({.name = "First", .beginCode = kBegin, .endCode = kEnd + 8});
+  add(two);
+  record({event(kBegin + 8, 1), event(kBegin, 10), event(kEnd, 40), event(kEnd + 8, 50)});
+
+  runAndStop();
+
+  constexpr auto kNanoseconds = platform::ssunit::ssunit_nanoseconds;
+  EXPECT_EQ(onlyFile().measurements,
+            (std::vector<FakeResultsFileService::Measurement>{
+                {"First", kNanoseconds, 40}, {"IO", kNanoseconds, 30}, {"IO", kNanoseconds, 49}}));
+  const Texts lines = platform_.log.texts(LogLevel::kInfo);
+  EXPECT_EQ(Texts(lines.end() - 2, lines.end()),
+            (Texts{"Writing out 1 result for First, min: 40, max: 40 ",
+                   "Writing out 2 result for IO, min: 30, max: 49 "}));
+}
+
+TEST_F(TraceRunnerTest, ValuesAreWrittenAsTheNearestDouble) {
+  add(params("Startup"));
+  record({event(kBegin, 10), event(kEnd, 9)});
+
+  runAndStop();
+
+  ASSERT_EQ(onlyFile().measurements.size(), 1U);
+  EXPECT_EQ(onlyFile().measurements[0].value, 18446744073709551616.0);
+  EXPECT_EQ(platform_.log.texts(LogLevel::kInfo).back(),
+            "Writing out 1 result for IO, min: 18446744073709551615, max: 18446744073709551615 ");
 }
 
 TEST_F(TraceRunnerTest, EventsOutsideTheRangeAreNotRecorded) {
