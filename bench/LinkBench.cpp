@@ -163,6 +163,6 @@ int main(int argc, char** argv) {
           {.messages = argc > 2 ? std::strtoul(argv[2], nullptr, 10) : 50'000,
            .rounds = argc > 3 ? std::atoi(argv[3]) : 5});
   (void)dispatch.stop(std::chrono::seconds(5));
-  link->close();
+  if (!link->close()) std::quick_exit(EXIT_FAILURE);
   return EXIT_SUCCESS;
 }

@@ -219,11 +219,11 @@ bool LinuxPlatform::close() {
   traces_->stop();
   const bool ended = dispatch_.stop(kJobsEndWithin);
   if (ended) traces_->close();
-  if (nats_) nats_->close();
+  const bool linkEnded = !nats_ || nats_->close();
   store_.close();
   logStatistics(LogLevel::kInfo, Counters::kCounted);
   log_->stop();
-  return ended;
+  return ended && linkEnded;
 }
 
 void LinuxPlatform::logStart() const {

@@ -58,7 +58,7 @@ class LinuxPlatform {
   // The services must be installed.
   [[nodiscard]] std::optional<StartFailure> open();
   // Ends the queues, writes what waits for the store, and tells the statistics in the log. False
-  // when a job would not end: the process must then end without destroying anything.
+  // when a job or the link would not end: the process must then end without destroying anything.
   [[nodiscard]] bool close();
 
  private:

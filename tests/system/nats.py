@@ -1,18 +1,24 @@
 """Real NATS servers of our own on loopback, and the programs that drive and read the link."""
 
+import base64
+import binascii
+import itertools
 import json
 import os
 import shutil
+import signal
 import socket
 import subprocess
 import tempfile
 import threading
+import time
 from pathlib import Path
 
 from harness import BIN, DEADLINE, WITH_US, stop_process, wait_for
 
 DRIVER = BIN / "halvox_link_driver"
 READER = BIN / "halvox_stream_reader"
+LONG_DEADLINE = 2 * DEADLINE  # for what takes seconds on an idle machine
 
 
 def free_ports(count):
@@ -62,6 +68,13 @@ class Server:
     def log(self):
         return (self.directory / "log").read_text(errors="replace")
 
+    def pause(self):
+        """From now on it answers nothing, until it is killed or resumed."""
+        self.process.send_signal(signal.SIGSTOP)
+
+    def resume(self):
+        self.process.send_signal(signal.SIGCONT)
+
     def kill(self):
         self.process.kill()
         self.process.wait(DEADLINE)
@@ -80,6 +93,84 @@ class Server:
             shutil.rmtree(self.directory, ignore_errors=True)
 
 
+class NatsKey:
+    """A key pair of Ed25519 in the text forms that NATS has for it. Needs openssl."""
+
+    KINDS = {"operator": 14 << 3, "account": 0, "user": 20 << 3}
+    SEED = 18 << 3
+
+    def __init__(self, kind, directory):
+        self._kind = self.KINDS[kind]
+        self._path = Path(directory) / f"{kind}-{next(_numbers)}.der"
+        self._openssl("genpkey", "-algorithm", "ed25519", "-outform", "DER", "-out", self._path)
+        public = self._openssl("pkey", "-inform", "DER", "-in", self._path, "-pubout", "-outform", "DER")
+        # Both forms end with the 32 bytes of the key itself.
+        self.public = self._text(bytes([self._kind]) + public[-32:])
+        self.seed = self._text(bytes([self.SEED | self._kind >> 5, (self._kind & 31) << 3])
+                               + self._path.read_bytes()[-32:])
+
+    def token(self, subject, name, claims):
+        """What this key says of another, by its public text, as a signed JWT."""
+        now = int(time.time())
+        said = {"jti": name, "iat": now, "iss": self.public, "name": name, "sub": subject,
+                "nats": {"version": 2, **claims}}
+        text = ".".join(self._base64(json.dumps(part).encode())
+                        for part in ({"typ": "JWT", "alg": "ed25519-nkey"}, said))
+        message = self._path.with_suffix(".text")
+        message.write_text(text)
+        signature = self._openssl("pkeyutl", "-sign", "-keyform", "DER", "-inkey", self._path, "-rawin",
+                                  "-in", message)
+        return f"{text}.{self._base64(signature)}"
+
+    @staticmethod
+    def _openssl(*arguments):
+        return subprocess.run(["openssl", *arguments], check=True, capture_output=True).stdout
+
+    @staticmethod
+    def _text(content):
+        checked = content + binascii.crc_hqx(content, 0).to_bytes(2, "little")
+        return base64.b32encode(checked).decode().rstrip("=")
+
+    @staticmethod
+    def _base64(content):
+        return base64.urlsafe_b64encode(content).decode().rstrip("=")
+
+
+_numbers = itertools.count()
+
+
+class Operator:
+    """Who a server trusts: an account that may use JetStream, and the users that it admits."""
+
+    UNLIMITED = dict.fromkeys(("subs", "data", "payload"), -1)
+    ACCOUNT = {**UNLIMITED, **dict.fromkeys(("imports", "exports", "conn", "leaf", "mem_storage", "disk_storage",
+                                             "streams", "consumer"), -1), "wildcards": True}
+
+    def __init__(self, directory):
+        self._directory = Path(directory)
+        operator, system = NatsKey("operator", directory), NatsKey("account", directory)
+        self._account = NatsKey("account", directory)
+        accounts = {
+            system.public: operator.token(system.public, "system",
+                                          {"type": "account", "limits": {**self.ACCOUNT, "mem_storage": 0,
+                                                                         "disk_storage": 0}}),
+            self._account.public: operator.token(self._account.public, "audio",
+                                                 {"type": "account", "limits": self.ACCOUNT})}
+        preload = ", ".join(f'{public}: "{token}"' for public, token in accounts.items())
+        self_signed = operator.token(operator.public, "operator", {"type": "operator"})
+        self.config = (f'operator: "{self_signed}"\nsystem_account: {system.public}\n'
+                       f"resolver: MEMORY\nresolver_preload: {{ {preload} }}")
+
+    def credentials(self, name):
+        """A credentials file of a new user."""
+        user = NatsKey("user", self._directory)
+        token = self._account.token(user.public, name, {"type": "user", "pub": {}, "sub": {}, **self.UNLIMITED})
+        path = self._directory / f"{name}.creds"
+        path.write_text(f"-----BEGIN NATS USER JWT-----\n{token}\n------END NATS USER JWT------\n\n"
+                        f"-----BEGIN USER NKEY SEED-----\n{user.seed}\n------END USER NKEY SEED------\n")
+        return path
+
+
 def cluster():
     """Three servers, not started yet, that form a cluster."""
     ports = free_ports(6)
@@ -88,21 +179,29 @@ def cluster():
                    port=ports[index], name=f"server{index}") for index in range(3)]
 
 
-class SilentServer:
-    """Accepts connections and says nothing."""
+# A server's first words when it wants the handshake of TLS next.
+TLS_GREETING = (b'INFO {"server_id":"silent","version":"2.9.10","proto":1,"headers":true,'
+                b'"max_payload":1048576,"tls_required":true}\r\n')
 
-    def __init__(self):
-        self._socket = socket.create_server(("127.0.0.1", 0), backlog=4096)
+
+class SilentServer:
+    """Accepts connections, perhaps greets, and says nothing more."""
+
+    def __init__(self, greeting=b"", port=0):
+        self._socket = socket.create_server(("127.0.0.1", port), backlog=4096)
         self.url = f"nats://127.0.0.1:{self._socket.getsockname()[1]}"
         self.accepted = []
+        self._greeting = greeting
         self._thread = threading.Thread(target=self._run, daemon=True)
 
     def _run(self):
         while True:
             try:
-                self.accepted.append(self._socket.accept()[0])
+                connection = self._socket.accept()[0]
             except OSError:
                 return
+            connection.sendall(self._greeting)
+            self.accepted.append(connection)
 
     def __enter__(self):
         self._thread.start()
@@ -168,6 +267,10 @@ class Driver:
     def acknowledged(self):
         """Messages that were confirmed so far, of all sessions."""
         return int(self.ask("acknowledged").split()[1])
+
+    def wait_until_acknowledged(self, count):
+        """Until so many messages of all sessions were confirmed, so that no flush is a race."""
+        wait_for(f"{count} acknowledgements", lambda: self.acknowledged() >= count, LONG_DEADLINE, pause=0.1)
 
     def end(self):
         """Ends it in order; then `counters` and `log` are there."""

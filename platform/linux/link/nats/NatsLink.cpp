@@ -35,7 +35,7 @@ NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environme
   }
 }
 
-NatsLink::~NatsLink() { close(); }
+NatsLink::~NatsLink() { (void)close(); }
 
 void NatsLink::discover(const TLMReportingService::BackendsCallback& found) {
   std::optional<Array> servers;
@@ -115,17 +115,58 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
   return error;
 }
 
-void NatsLink::close() {
+bool NatsLink::close() {
   {
     const MutexLock lock(mutex_);
-    if (closeBy_) return;
-    closeBy_ = std::chrono::steady_clock::now() + kCloseTime;
+    if (closeBy_) return !thread_.joinable();
+    const Time now = std::chrono::steady_clock::now();
+    closeBy_ = now + kCloseTime;
+    leaveBy_ = isConnecting_ ? now + kAttemptEndTime : *closeBy_ + kConnectionEndTime;
     changed_.notifyAll();
   }
-  if (thread_.joinable()) thread_.join();
+  if (!awaitThread()) {
+    kLog.notice("the link ends without waiting for a server any longer");
+    giveUpRest();
+    keepForEver();
+    return false;
+  }
   // After this no callback of the library runs; if it does not end, they may still find this here.
-  if (nats_CloseAndWait(kLibraryEndTime.count()) == NATS_OK) return;
+  if (nats_CloseAndWait(kLibraryEndTime.count()) == NATS_OK) return true;
   kLog.error("the client library of the link did not end in time");
+  keepForEver();
+  return true;
+}
+
+// False when it is still busy when its time is over.
+bool NatsLink::awaitThread() {
+  {
+    const MutexLock lock(mutex_);
+    if (!thread_.joinable()) return true;
+    while (!hasThreadEnded_ && std::chrono::steady_clock::now() < leaveBy_) {
+      changed_.waitUntil(mutex_, leaveBy_);
+    }
+    if (!hasThreadEnded_) return false;
+  }
+  thread_.join();
+  return true;
+}
+
+// Does for the thread what it does at its end, but for the connection.
+void NatsLink::giveUpRest() {
+  std::vector<PendingAcks::Entry> lost;
+  std::deque<OutgoingMessage> unsent;
+  {
+    const MutexLock lock(mutex_);
+    isConnected_ = false;
+    lost = pending_.takeAll();
+    unsent.swap(queue_);
+  }
+  abandon(lost, "the connection ended");
+  fail(unsent, "the service ended");
+  answerWaiters();
+}
+
+void NatsLink::keepForEver() {
   static auto* const kept = new std::vector<std::shared_ptr<NatsLink>>;  // never destroyed
   if (auto self = weak_from_this().lock()) kept->push_back(std::move(self));
 }
@@ -220,13 +261,26 @@ void NatsLink::run() {
         dropConnection();
         break;
       case Step::kEnd:
-        drain();
-        dropConnection();
-        answerWaiters();
-        nats_ReleaseThreadMemory();
+        end();
         return;
     }
   }
+}
+
+void NatsLink::end() {
+  {
+    // A library that looks for its server lets nobody close the connection in between.
+    const MutexLock lock(mutex_);
+    if (!isConnected_) leaveBy_ = std::chrono::steady_clock::now() + kAttemptEndTime;
+    changed_.notifyAll();
+  }
+  drain();
+  dropConnection();
+  answerWaiters();
+  nats_ReleaseThreadMemory();
+  const MutexLock lock(mutex_);
+  hasThreadEnded_ = true;
+  changed_.notifyAll();
 }
 
 void NatsLink::answerWaiters() {

@@ -57,12 +57,19 @@ struct OutgoingMessage {
 // Only a stream whose leader changes in less time than a message takes to the server and back can
 // take a later message before one that it had no leader for.
 //
+// The library's own attempts cannot be called off: while it connects it holds its lock, and nothing
+// bounds how long a server may take over the handshake of TLS. So close() leaves the thread behind
+// when it does not come back soon; everything that it was to deliver is then given up before.
+//
 // All functions may be called by any thread, and none waits for a server but close().
 class NatsLink : public std::enable_shared_from_this<NatsLink> {
  public:
   static constexpr std::chrono::seconds kDiscoveryTime{8};
   static constexpr std::chrono::seconds kAttemptPause{1};
   static constexpr std::chrono::seconds kCloseTime{3};
+  static constexpr std::chrono::milliseconds kAttemptEndTime{500};
+  // More than the library's own limits for the end of a connection together.
+  static constexpr std::chrono::seconds kConnectionEndTime{5};
   static constexpr std::chrono::seconds kAckTime{30};
   static constexpr std::chrono::milliseconds kResendPause{100};
   static constexpr std::size_t kQueueBytes = 32U << 20U;
@@ -79,8 +86,10 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   [[nodiscard]] std::optional<Error> refuseAtEnd() HALVOX_EXCLUDES(mutex_);
   // Takes the message, or says why not.
   [[nodiscard]] std::optional<Error> send(OutgoingMessage message) HALVOX_EXCLUDES(mutex_);
-  // Lets what was taken go out, at most kCloseTime, then ends the connection and the library.
-  void close() HALVOX_EXCLUDES(mutex_);
+  // Lets what was taken go out, at most kCloseTime, then ends the connection and the library. Of an
+  // attempt to connect it awaits the end for kAttemptEndTime. False when the thread was left
+  // behind: then this object stays, and so must what it was made with.
+  [[nodiscard]] bool close() HALVOX_EXCLUDES(mutex_);
 
  private:
   using Time = std::chrono::steady_clock::time_point;
@@ -99,6 +108,10 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   std::optional<Time> nextTime() HALVOX_REQUIRES(mutex_);
   void waitForChange() HALVOX_REQUIRES(mutex_);
   void wakeThread() HALVOX_REQUIRES(mutex_);
+  void end() HALVOX_EXCLUDES(mutex_);
+  [[nodiscard]] bool awaitThread() HALVOX_EXCLUDES(mutex_);
+  void giveUpRest() HALVOX_EXCLUDES(mutex_);
+  void keepForEver();
   void answerWaiters() HALVOX_EXCLUDES(mutex_);
   void expire(std::uint64_t waiter) HALVOX_EXCLUDES(mutex_);
   void countRefused();
@@ -127,6 +140,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
 
   // The connection (NatsLinkConnection.cpp).
   void connect() HALVOX_EXCLUDES(mutex_);
+  void endAttempt() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] std::string open(NatsConnection& connection, JetStreamContext& context);
   [[nodiscard]] natsStatus configure(natsOptions* options);
   [[nodiscard]] natsStatus secure(natsOptions* options);
@@ -154,6 +168,9 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   Flow flow_ HALVOX_GUARDED_BY(mutex_) = Flow::kFlowing;
   Time probeAt_ HALVOX_GUARDED_BY(mutex_){};  // while holding
   std::optional<Time> closeBy_ HALVOX_GUARDED_BY(mutex_);
+  Time leaveBy_ HALVOX_GUARDED_BY(mutex_){};  // when close() leaves the thread behind
+  bool isConnecting_ HALVOX_GUARDED_BY(mutex_) = false;
+  bool hasThreadEnded_ HALVOX_GUARDED_BY(mutex_) = false;
   Time nextAttempt_ HALVOX_GUARDED_BY(mutex_){};
   std::string lastFailure_ HALVOX_GUARDED_BY(mutex_);  // empty when the last attempt succeeded
   std::uint64_t lastWaiter_ HALVOX_GUARDED_BY(mutex_) = 0;

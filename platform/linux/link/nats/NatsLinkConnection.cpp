@@ -169,6 +169,11 @@ std::string NatsLink::open(NatsConnection& connection, JetStreamContext& context
 }
 
 void NatsLink::connect() {
+  {
+    const MutexLock lock(mutex_);
+    if (closeBy_) return;
+    isConnecting_ = true;
+  }
   NatsConnection connection;
   JetStreamContext context;
   std::string failure = open(connection, context);
@@ -176,6 +181,7 @@ void NatsLink::connect() {
     natsConnection* const opened = connection.get();
     {
       const MutexLock lock(mutex_);
+      endAttempt();
       connection_ = std::move(connection);
       context_ = std::move(context);
       lastFailure_.clear();
@@ -189,6 +195,7 @@ void NatsLink::connect() {
   std::optional<std::uint64_t> worthALine;
   {
     const MutexLock lock(mutex_);
+    endAttempt();
     lastFailure_ = failure;
     nextAttempt_ = std::chrono::steady_clock::now() + kAttemptPause;
     unsent.swap(queue_);
@@ -200,11 +207,20 @@ void NatsLink::connect() {
   answerWaiters();
 }
 
+// From here on the thread does nothing that takes longer than close() has time for.
+void NatsLink::endAttempt() {
+  isConnecting_ = false;
+  if (closeBy_) leaveBy_ = *closeBy_ + kConnectionEndTime;
+}
+
 // Lets the library's threads return from all calls of ours. Ended before that, it leaves a message
 // behind which one of them was about to free.
 void NatsLink::drain() {
   natsConnection* const connection = connection_.get();
-  if (connection == nullptr) return;
+  {
+    const MutexLock lock(mutex_);
+    if (connection == nullptr || !isConnected_) return;
+  }
   if (natsConnection_Status(connection) != NATS_CONN_STATUS_CONNECTED) return;
   if (natsConnection_DrainTimeout(connection, kDrainTime.count()) != NATS_OK) return;
   const Time end = std::chrono::steady_clock::now() + 2 * kDrainTime;
@@ -230,11 +246,12 @@ void NatsLink::dropConnection() {
     lost = pending_.takeAll();
     if (closeBy_) unsent.swap(queue_);
   }
+  // First, because the library may keep the thread until a server speaks.
+  abandon(lost, "the connection ended");
+  fail(unsent, "the service ended");
   if (connection) natsConnection_Close(connection.get());
   context.reset();
   connection.reset();
-  abandon(lost, "the connection ended");
-  fail(unsent, "the service ended");
 }
 
 void NatsLink::onAvailable(natsConnection* connection) {

@@ -19,8 +19,10 @@ struct NatsEnvironment {
 class NatsTlmReporting : public TLMReportingService {
  public:
   // Refuses what comes later, lets what was taken go out within a few seconds, tells whoever still
-  // waits, and ends the connection. Blocks; call it once no other thread calls.
-  virtual void close() = 0;
+  // waits, and ends the connection. Blocks; call it once no other thread calls. False when a thread
+  // is left behind that waits for a server: what it uses, the environment too, must then stay until
+  // the process ends.
+  [[nodiscard]] virtual bool close() = 0;
 };
 
 // Whether this build has that back-end.

@@ -95,9 +95,9 @@ NatsTlmReportingService::NatsTlmReportingService(Configuration::Link options,
       dispatch_(environment.dispatch),
       link_(std::make_shared<NatsLink>(std::move(options), environment)) {}
 
-NatsTlmReportingService::~NatsTlmReportingService() { close(); }
+NatsTlmReportingService::~NatsTlmReportingService() { (void)close(); }
 
-void NatsTlmReportingService::close() { link_->close(); }
+bool NatsTlmReportingService::close() { return link_->close(); }
 
 TLMReportingService::Token NatsTlmReportingService::TLMHierarchyTokenCreate() {
   std::string text = instance_ + "-";

@@ -33,7 +33,7 @@ class NatsTlmReportingService final : public NatsTlmReporting {
   TLMReportingOutcome TLMReportingSendOneMessage(const Dictionary& sessionInfo,
                                                  const Dictionary& userInfo,
                                                  const TLMReportingMessage& message) override;
-  void close() override;
+  [[nodiscard]] bool close() override;
 
  private:
   class LinkedSession;

@@ -12,6 +12,7 @@
 //                  "counted VALUE NAME", and the lines of the log, "log LINE"; then "ended"
 #include <chrono>
 #include <condition_variable>
+#include <cstdlib>
 #include <filesystem>
 #include <iostream>
 #include <map>
@@ -178,7 +179,7 @@ int drive(const Configuration& configuration) {
     }
   }
   (void)dispatch.stop(std::chrono::seconds(5));
-  link->close();
+  const bool isAllEnded = link->close();
   const TLMReportingOutcome late = link->TLMReportingSendOneMessage({}, {}, {4, 1, {}});
   if (late.sent) std::cout << "log a message was taken after the end\n";
   for (const CounterReading& reading : statistics.snapshot()) {
@@ -188,6 +189,7 @@ int drive(const Configuration& configuration) {
   }
   for (const auto& line : neighbours.log.lines()) std::cout << "log " << line.text << "\n";
   std::cout << "ended" << std::endl;
+  if (!isAllEnded) std::quick_exit(EXIT_SUCCESS);
   return EXIT_SUCCESS;
 }
 
