@@ -25,7 +25,7 @@ using platform::PerformanceTraceService;
 // What the callbacks of the framework log with.
 constexpr platform::UnitLog kTraceLog(&HVReportingTraceCategory, "HVReportingSession");
 
-// The general log of the service, for a plain line that no level holds back.
+// The general log of the service, for a plain line of no unit.
 platform::LogCategory& generalCategory() {
   static platform::LogCategory& category =
       platform::log().createCategory(kHVReportingLogSubsystem, "general");

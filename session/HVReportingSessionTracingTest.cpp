@@ -185,6 +185,24 @@ TEST_F(HVReportingSessionTracingTest, NextRunMakesANewRunner) {
   session_->stop();
 }
 
+TEST_F(HVReportingSessionTracingTest, EmptyPathOfALaterRunRecordsWithTheRunnerThatIsThere) {
+  chooseRunner();
+  session_->start();
+  const auto first = session_->traceRunner();
+  session_->stop();
+  session_->setConfiguration(Dictionary{{HVReportingMeridelPlistFilePath, ""}});
+  forgetWhatHappened();
+
+  session_->start();
+  EXPECT_TRUE(session_->startedTracing());
+  session_->stop();
+
+  EXPECT_EQ(session_->traceRunner(), first);
+  EXPECT_THAT(operations(), testing::Contains("ktrace start"));
+  EXPECT_THAT(operations(), testing::Contains("ktrace destroy"));
+  EXPECT_EQ(lines(LogLevel::kError, "hvrr"), Texts{"TracefileName empty. Failed to setup tracing"});
+}
+
 // --- The framework ------------------------------------------------------------------------------
 
 TEST_F(HVReportingSessionTracingTest, FrameworkTraceEndsWithItsURL) {
