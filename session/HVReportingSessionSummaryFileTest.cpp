@@ -89,6 +89,17 @@ TEST_F(HVReportingSessionSummaryFileTest, HoldsTheVolumeMessagesAndNotTheSummary
                                   "Volume_Summary_1", "Volume_Summary_2"));
 }
 
+TEST_F(HVReportingSessionSummaryFileTest, IsWrittenThoughNothingWasPlayed) {
+  silent(10);
+  platform_.log.clear();
+
+  session_->stop();
+
+  EXPECT_THAT(keys(), ElementsAre("Playback_Start_1"));
+  EXPECT_THAT(platform_.log.texts(LogLevel::kDefault),
+              ElementsAre("sending summary event for reporter 7"));
+}
+
 TEST_F(HVReportingSessionSummaryFileTest, ComesBeforeTheSummaryEvent) {
   send({{"foo", 1}});
   platform_.log.clear();

@@ -1,3 +1,4 @@
+#include <algorithm>
 #include <memory>
 #include <string>
 #include <vector>
@@ -202,6 +203,36 @@ TEST_F(HVReportingSessionSummaryTest, TheLinkGetsVolumeMessagesThenTheSummaryThe
                           "send session 1 65535/65535", "flush session 1"));
   EXPECT_EQ(*platform_.tlmReporting.messages().back().payload.find("audiotag"),
             Value("UndefinedUnknown"));
+}
+
+TEST_F(HVReportingSessionSummaryTest, TheSummaryHasAllBitsOfItsCategoryAndTypeSet) {
+  session_->stop();
+  session_->setTlmReportingEnabled(true);
+  platform_.tlmReporting.answerDiscoveries(
+      platform::FakeTlmReportingService::Answering::kBeforeReturning, platform::Array{"server"});
+  session_->start();
+  send({{"foo", 1}});
+
+  session_->stop();
+  platform_.dispatch.runUntilIdle();
+
+  const auto lines = platform_.log.texts(LogLevel::kDebug);
+  EXPECT_EQ(
+      std::ranges::count_if(
+          lines, [](const auto& text) { return text.ends_with(" : category -1 : type 65535"); }),
+      1);
+}
+
+TEST_F(HVReportingSessionSummaryTest, VolumesThatNeverPlayedSendNoVolumeEvent) {
+  sendVolume(0.5, 0, 10);
+  sendVolume(0.75, 0, 20);
+  sendVolume(0.5, 0, 30);
+
+  session_->stop();
+
+  EXPECT_THAT(platform_.log.texts(LogLevel::kDefault),
+              ElementsAre("sending summary event for reporter 7"));
+  EXPECT_THAT(platform_.analytics.sentNames(), IsEmpty());
 }
 
 TEST_F(HVReportingSessionSummaryTest, TheSummaryCoversTheVolumeMessages) {

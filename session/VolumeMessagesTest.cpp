@@ -3,6 +3,7 @@
 #include <cmath>
 #include <limits>
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include <gmock/gmock.h>
@@ -36,6 +37,14 @@ class VolumeMessagesTest : public testing::Test {
   }
   std::vector<Dictionary> messages(double minimum) const {
     return HVReportingSession::createVolumeMessages(history_, minimum);
+  }
+  // What all have under a key.
+  std::vector<std::string> texts(std::string_view key, double minimum = 1) const {
+    std::vector<std::string> result;
+    for (const Dictionary& message : messages(minimum)) {
+      result.push_back(describe(*message.find(key)));
+    }
+    return result;
   }
   // "volume: seconds" of each.
   std::vector<std::string> intervals(double minimum = 1) const {
@@ -283,10 +292,25 @@ TEST_F(VolumeMessagesTest, VolumesAndSecondsAreBucketed) {
 }
 
 TEST_F(VolumeMessagesTest, VolumeBucketsAreSixteenthsWithFourDigits) {
-  playing(0.07, 0);
-  silent(0.07, 10);
+  for (int sixteenths = 0; sixteenths <= 16; ++sixteenths) {
+    playing(sixteenths / 16.0, 10 * sixteenths);
+  }
+  silent(1, 170);
 
-  EXPECT_EQ(*messages(1).at(0).find("RQSessionVolumeBucketed"), Value("0.0625"));
+  EXPECT_THAT(
+      texts("RQSessionVolumeBucketed"),
+      ElementsAre("0.0", "0.0625", "0.125", "0.1875", "0.25", "0.3125", "0.375", "0.4375", "0.5",
+                  "0.5625", "0.625", "0.6875", "0.75", "0.8125", "0.875", "0.9375", "1.0"));
+}
+
+TEST_F(VolumeMessagesTest, SecondsBucketsAreElevenWholeNumbers) {
+  for (const double seconds : {0, 1, 5, 10, 30, 60, 300, 1800, 3600, 7200, 18'000}) {
+    playing(0.5, 0);
+    silent(0.5, seconds);
+  }
+
+  EXPECT_THAT(texts("play_secondsBucketed", -1),
+              ElementsAre("0", "1", "5", "10", "30", "60", "300", "1800", "3600", "7200", "18000"));
 }
 
 TEST_F(VolumeMessagesTest, OtherMessagesInBetweenChangeNothing) {
