@@ -11,6 +11,7 @@
 #include <unistd.h>
 
 #include "platform/linux/UniqueHandle.h"
+#include "platform/linux/settings/LinkedFiles.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -70,11 +71,14 @@ std::optional<PreferenceFileError> replace(const std::filesystem::path& file,
   return std::nullopt;
 }
 
-// The file that a link stands for, so that the link stays.
+// The file that a link stands for, be it there or not, so that the link stays.
 std::filesystem::path target(const std::filesystem::path& file) {
-  std::error_code ignored;
-  const auto real = std::filesystem::canonical(file, ignored);
-  return ignored ? file : real;
+  std::error_code error;
+  const auto real = std::filesystem::canonical(file, error);
+  if (!error) return real;
+  if (error != std::errc::no_such_file_or_directory) return file;
+  const auto linked = linkedFiles(std::filesystem::absolute(file, error));
+  return linked.empty() ? file : linked.back();
 }
 
 }  // namespace

@@ -1,5 +1,8 @@
 #include "platform/linux/settings/PreferenceWriting.h"
 
+#include <csignal>
+
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -7,6 +10,26 @@
 
 namespace halvox::platform::linux_ {
 namespace {
+
+// What is written beyond so many bytes of a file fails, as on a full disk.
+class FilesMayNotGrow {
+ public:
+  explicit FilesMayNotGrow(rlim_t bytes) {
+    ::getrlimit(RLIMIT_FSIZE, &old_);
+    const rlimit limit{bytes, old_.rlim_max};
+    ::setrlimit(RLIMIT_FSIZE, &limit);
+  }
+  FilesMayNotGrow(const FilesMayNotGrow&) = delete;
+  FilesMayNotGrow& operator=(const FilesMayNotGrow&) = delete;
+  ~FilesMayNotGrow() {
+    ::setrlimit(RLIMIT_FSIZE, &old_);
+    std::signal(SIGXFSZ, signal_);
+  }
+
+ private:
+  rlimit old_{};
+  void (*signal_)(int) = std::signal(SIGXFSZ, SIG_IGN);
+};
 
 class PreferenceWritingTest : public SettingsTest {
  protected:
@@ -67,6 +90,29 @@ TEST_F(PreferenceWritingTest, ALinkStaysALink) {
 
   EXPECT_TRUE(std::filesystem::is_symlink(file_));
   EXPECT_EQ(read(scratch_ / "real.toml"), "a = 2\n");
+}
+
+TEST_F(PreferenceWritingTest, ALinkToAFileThatIsMissingStaysALinkToo) {
+  std::filesystem::create_directories(file_.parent_path());
+  std::filesystem::create_symlink(scratch_ / "elsewhere" / "real.toml", file_);
+
+  EXPECT_FALSE(changePreferenceFile(file_, to("a = 2\n")).has_value());
+
+  EXPECT_TRUE(std::filesystem::is_symlink(file_));
+  EXPECT_EQ(read(scratch_ / "elsewhere" / "real.toml"), "a = 2\n");
+}
+
+TEST_F(PreferenceWritingTest, AFailedWriteLeavesTheOldFileAndNothingElse) {
+  write(file_, "a = 1\n");
+  const auto error = [this] {
+    const FilesMayNotGrow limit(8);
+    return changePreferenceFile(file_, to("a = \"much too long\"\n"));
+  }();
+
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->description, file_.native() + ": File too large");
+  EXPECT_EQ(read(file_), "a = 1\n");
+  EXPECT_EQ(filesBeside(), 1U);
 }
 
 TEST_F(PreferenceWritingTest, ARefusedEditLeavesTheFileAlone) {
