@@ -129,6 +129,17 @@ Parsed<client::ReporterID> parseReporterID(std::string_view text) {
                        "\" is no reporter ID; expected a whole number of 64 bits, such as 7"};
 }
 
+Parsed<std::int64_t> parseNumber(std::string_view text) {
+  if (const auto number = parseWhole<std::int64_t>(text)) return *number;
+  return ArgumentError{"\"" + std::string(text) + "\" is no number; expected a whole number"};
+}
+
+Parsed<std::uint64_t> parseCount(std::string_view text) {
+  if (const auto count = parseWhole<std::uint64_t>(text)) return *count;
+  return ArgumentError{"\"" + std::string(text) +
+                       "\" is no number; expected a whole number from 0 on, such as 10"};
+}
+
 Parsed<client::Category> parseCategory(std::string_view text) {
   if (const auto number = parseWhole<client::Category>(text)) return *number;
   if (const auto category = client::findCategory(text)) return *category;

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <chrono>
+#include <cstdint>
 #include <optional>
 #include <string>
 #include <string_view>
@@ -20,6 +21,9 @@ using Parsed = std::variant<T, ArgumentError>;
 
 // Whole numbers, decimal or with 0x hexadecimal.
 Parsed<client::ReporterID> parseReporterID(std::string_view text);
+Parsed<std::int64_t> parseNumber(std::string_view text);
+// How many: a whole number from 0 on, decimal or with 0x hexadecimal.
+Parsed<std::uint64_t> parseCount(std::string_view text);
 // Names in any case of letters, or numbers.
 Parsed<client::Category> parseCategory(std::string_view text);
 Parsed<client::EventType> parseEventType(std::string_view text);

@@ -58,6 +58,15 @@ TEST(ArgumentsTest, TypesAndServicesAreNamesOrNumbersOf16Bits) {
   EXPECT_EQ(valueOf(parseServiceType("2")), 2);
 }
 
+TEST(ArgumentsTest, CountsAreWholeNumbersFromZeroOn) {
+  EXPECT_EQ(valueOf(parseCount("0")), 0U);
+  EXPECT_EQ(valueOf(parseCount("10")), 10U);
+  EXPECT_EQ(valueOf(parseCount("18446744073709551615")), 18'446'744'073'709'551'615U);
+  for (const char* wrong : {"", "x", "-1", "1.5", "1e3", " 1", "18446744073709551616"}) {
+    EXPECT_FALSE(valueOf(parseCount(wrong))) << wrong;
+  }
+}
+
 TEST(ArgumentsTest, SecondsMayBeFractionsButNotNothing) {
   EXPECT_EQ(valueOf(parseSeconds("0.5")), std::chrono::milliseconds(500));
   EXPECT_EQ(valueOf(parseSeconds("0.0001")), std::chrono::milliseconds(1));

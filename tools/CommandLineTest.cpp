@@ -1,10 +1,23 @@
 #include "tools/CommandLine.h"
 
+#include <fstream>
+#include <iterator>
+#include <regex>
 #include <sstream>
 #include <string>
 #include <vector>
 
 #include <gtest/gtest.h>
+
+#include "tools/Drivers.h"
+#include "tools/Notify.h"
+#include "tools/Preferences.h"
+#include "tools/Records.h"
+#include "tools/Requests.h"
+#include "tools/Script.h"
+#include "tools/SnapshotFiles.h"
+#include "tools/Summary.h"
+#include "tools/Traces.h"
 
 namespace halvox::tools {
 namespace {
@@ -25,7 +38,7 @@ T requestOf(const std::variant<Command, CommandLineText>& parsed) {
     ADD_FAILURE() << std::get<CommandLineText>(parsed).text;
     return {};
   }
-  return std::get<T>(std::get<Request>(command->what));
+  return std::get<T>(*command->asked<Request>());
 }
 
 std::string errorOf(const Words& words) {
@@ -101,7 +114,7 @@ TEST(CommandLineTest, EventsTakeFilters) {
                              "1970-01-01T00:00:20Z", "--last", "3", "--follow", "--database", "d"});
 
   ASSERT_TRUE(std::holds_alternative<Command>(parsed));
-  const auto& events = std::get<ShowEvents>(std::get<Command>(parsed).what);
+  const auto& events = *std::get<Command>(parsed).asked<RecordSelection>();
   EXPECT_EQ(events.names, (std::vector<std::string>{"a.*", "b"}));
   EXPECT_EQ(events.since, 10.0);
   EXPECT_EQ(events.until, 20.0);
@@ -119,7 +132,10 @@ T runOf(const Words& words) {
     ADD_FAILURE() << std::get<CommandLineText>(parsed).text;
     return {};
   }
-  return std::get<T>(command->what);
+  const T* asked = command->asked<T>();
+  if (asked != nullptr) return *asked;
+  ADD_FAILURE() << "it asks for something else";
+  return {};
 }
 
 TEST(CommandLineTest, MetricsAreChosenByNumberAndTime) {
@@ -191,6 +207,31 @@ TEST(CommandLineTest, ErrorsNameTheCommandAndTheArgument) {
   EXPECT_EQ(errorOf({"configure", "7", "{"}).substr(0, 34), "halvoxctl configure: JSON: no JSON");
 }
 
+TEST(CommandLineTest, CountsAndActionsThatAreNoneAreNamedWithWhatIsExpected) {
+  for (const std::string command : {"events", "metrics", "power", "link", "snapshots", "summary"}) {
+    EXPECT_EQ(errorOf({command, "--last", "x"}),
+              "halvoxctl " + command +
+                  ": --last: \"x\" is no number; expected a whole number from 0 on, such as 10");
+    EXPECT_NE(errorOf({command, "--last", "-1"}), "");
+  }
+  EXPECT_EQ(errorOf({"preferences", "frob", "org.example"}),
+            "halvoxctl preferences: ACTION: \"frob\" is not known; expected get, set or unset");
+}
+
+TEST(CommandLineTest, PreferencesAreGotSetAndUnset) {
+  using Action = Preferences::Action;
+
+  EXPECT_EQ(runOf<Preferences>({"preferences", "get", "d"}).action, Action::kGet);
+  EXPECT_EQ(runOf<Preferences>({"preferences", "set", "d", "k", "v"}).action, Action::kSet);
+  EXPECT_EQ(runOf<Preferences>({"preferences", "unset", "d", "k"}).action, Action::kUnset);
+}
+
+TEST(CommandLineTest, ErrorsNameTheCommandBelowAnother) {
+  EXPECT_EQ(errorOf({"trace", "export", "f"}), "halvoxctl trace export: --to is required");
+  EXPECT_EQ(errorOf({"link", "--session", "x"}),
+            "halvoxctl link: --session: \"x\" is no number; expected a whole number");
+}
+
 TEST(CommandLineTest, AnUnknownCommandIsAnsweredWithTheKnownOnes) {
   const std::string error = errorOf({"craete", "7"});
 
@@ -205,17 +246,73 @@ TEST(CommandLineTest, ArgumentsTooManyAreRefused) {
   EXPECT_NE(errorOf({}), "");
 }
 
-TEST(CommandLineTest, EveryCommandHasHelpWithAnExample) {
-  for (const char* command :
-       {"create",  "set-type", "type",        "configure", "start", "send",
-        "stop",    "destroy",  "valid",       "list",      "kill",  "run",
-        "shell",   "events",   "metrics",     "power",     "link",  "snapshots",
-        "summary", "drivers",  "preferences", "notify"}) {
-    const auto parsed = parse({command, "--help"});
-    ASSERT_TRUE(std::holds_alternative<CommandLineText>(parsed)) << command;
-    const auto& text = std::get<CommandLineText>(parsed);
-    EXPECT_EQ(text.status, ExitStatus::kDone) << command;
-    EXPECT_NE(text.text.find("Example:\n"), std::string::npos) << command;
+// All commands there are, as the answer to one that is none lists them; then those below others.
+std::vector<Words> allCommands() {
+  std::istringstream list(errorOf({"nonesuch"}));
+  std::vector<Words> commands;
+  std::string word;
+  while (list >> word && word != "expected") {
+  }
+  while (list >> word) commands.push_back({word.substr(0, word.find(','))});
+  for (const char* below : {"show", "extract"}) commands.push_back({"snapshots", below});
+  for (const char* below : {"record", "show", "export"}) commands.push_back({"trace", below});
+  return commands;
+}
+
+std::string helpOf(Words words) {
+  words.emplace_back("--help");
+  const auto parsed = parse(words);
+  const auto* text = std::get_if<CommandLineText>(&parsed);
+  if (text == nullptr || text->status != ExitStatus::kDone) return "";
+  return text->text;
+}
+
+TEST(CommandLineTest, EveryCommandHasHelpWithAnExampleOfItself) {
+  ASSERT_GT(allCommands().size(), 25U);
+  for (const Words& words : allCommands()) {
+    std::string name = "halvoxctl";
+    for (const auto& word : words) name += " " + word;
+    const std::string help = helpOf(words);
+
+    EXPECT_NE(help.find("Usage: " + name + " "), std::string::npos) << name;
+    const auto example = help.find("Example:\n");
+    ASSERT_NE(example, std::string::npos) << name;
+    EXPECT_NE(help.find(name, example), std::string::npos) << name;
+  }
+}
+
+TEST(CommandLineTest, HelpHasNoLongLinesAndNoGaps) {
+  auto all = allCommands();
+  all.push_back({});
+  for (const Words& words : all) {
+    const std::string help = helpOf(words);
+    std::istringstream lines(help);
+    for (std::string line; std::getline(lines, line);) EXPECT_LE(line.size(), 100U) << line;
+    EXPECT_EQ(help.find("\n\n\n"), std::string::npos) << help;
+  }
+}
+
+TEST(CommandLineTest, HelpTellsOfTheSocketOnlyWhereTheServiceIsAsked) {
+  for (const Words& words : {Words{}, Words{"list"}, Words{"run"}, Words{"trace", "record"}}) {
+    EXPECT_NE(helpOf(words).find("--socket"), std::string::npos);
+    EXPECT_NE(helpOf(words).find("--timeout"), std::string::npos);
+  }
+  for (const Words& words : {Words{"events"}, Words{"drivers"}, Words{"snapshots", "show"}}) {
+    EXPECT_EQ(helpOf(words).find("--socket"), std::string::npos);
+    EXPECT_EQ(helpOf(words).find("--timeout"), std::string::npos);
+  }
+}
+
+// The completion is a file of its own, which forgets commands easily.
+TEST(CommandLineTest, TheShellCompletesEveryCommand) {
+  std::ifstream file(HALVOX_COMPLETION);
+  const std::string text{std::istreambuf_iterator<char>(file), {}};
+  const auto begin = text.find("commands=\"");
+  ASSERT_NE(begin, std::string::npos);
+  const std::string listed = text.substr(begin, text.find("\n  local common", begin) - begin);
+  for (const Words& words : allCommands()) {
+    const std::regex word("[\\s\"]" + words.front() + "[\\s\"]");
+    EXPECT_TRUE(std::regex_search(listed, word)) << words.front();
   }
 }
 

@@ -11,9 +11,9 @@
 #include "platform/linux/drivers/ConfiguredSources.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/LinuxIOReportService.h"
-#include "platform/linux/runtime/Configuration.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "tools/JsonText.h"
+#include "tools/ServiceConfiguration.h"
 
 namespace halvox::tools {
 namespace {
@@ -121,7 +121,7 @@ std::string jsonLine(const IOReportChannel& channel, std::optional<double> secon
 // Samples the channels that the request chose.
 class DriverPrinter {
  public:
-  DriverPrinter(IOReportService& service, const ShowDrivers& request, EventForm form,
+  DriverPrinter(IOReportService& service, const ShowDrivers& request, OutputForm form,
                 std::ostream& out)
       : service_(service), form_(form), out_(out) {
     std::optional<platform::IOReportError> error;
@@ -141,7 +141,7 @@ class DriverPrinter {
       out_ << formatChannel(channel, seconds, form_) << '\n';
       return 0;
     });
-    if (seconds && form_ == EventForm::kText) out_ << '\n';
+    if (seconds && form_ == OutputForm::kText) out_ << '\n';
     out_.flush();
   }
 
@@ -169,7 +169,7 @@ class DriverPrinter {
   }
 
   IOReportService& service_;
-  EventForm form_;
+  OutputForm form_;
   std::ostream& out_;
   IOReportService::Channels channels_;
   IOReportService::Subscription subscription_;
@@ -178,24 +178,21 @@ class DriverPrinter {
 }  // namespace
 
 std::string formatChannel(const IOReportChannel& channel, std::optional<double> seconds,
-                          EventForm form) {
-  return form == EventForm::kJson ? jsonLine(channel, seconds) : textLine(channel, seconds);
+                          OutputForm form) {
+  return form == OutputForm::kJson ? jsonLine(channel, seconds) : textLine(channel, seconds);
 }
 
-ExitStatus showDrivers(const ShowDrivers& request, EventForm form, std::ostream& out,
+ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream& out,
                        int outputDescriptor, std::ostream& errors) {
-  auto loaded = platform::linux_::loadConfiguration();
-  if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
-    errors << "halvoxctl drivers: " << harmlessText(error->description) << '\n';
-    return ExitStatus::kBadConfiguration;
-  }
+  const auto configuration = serviceConfiguration(Complaint("drivers", errors));
+  if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   // Lives as long as the process, because the sources' log remembers it.
   static ErrorLog errorLog;
   platform::linux_::ownDriversCategory() = &errorLog;
   platform::linux_::CounterStatisticsService statistics;
   platform::linux_::LinuxIOReportService service(
       platform::linux_::makeDriverSources(
-          std::get<platform::linux_::Configuration>(loaded).drivers),
+          std::get<platform::linux_::Configuration>(configuration).drivers),
       statistics);
   service.open();
   DriverPrinter printer(service, request, form, out);

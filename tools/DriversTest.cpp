@@ -31,12 +31,12 @@ IOReportChannel frames() {
 }
 
 TEST(DriversTest, AChannelIsALineOfItsNamesItsValueAndItsUnit) {
-  EXPECT_EQ(formatChannel(frames(), std::nullopt, EventForm::kText),
+  EXPECT_EQ(formatChannel(frames(), std::nullopt, OutputForm::kText),
             "HDA\\u001b  Tx  -  frames  96000 frames");
 }
 
 TEST(DriversTest, AWatchedChannelIsShownPerSecond) {
-  EXPECT_EQ(formatChannel(frames(), 2.0, EventForm::kText),
+  EXPECT_EQ(formatChannel(frames(), 2.0, OutputForm::kText),
             "HDA\\u001b  Tx  -  frames  48000.0 frames/s");
 }
 
@@ -44,7 +44,7 @@ TEST(DriversTest, JsonHasAllNames) {
   auto channel = frames();
   channel.driverName = "HDA";
 
-  EXPECT_EQ(formatChannel(channel, std::nullopt, EventForm::kJson),
+  EXPECT_EQ(formatChannel(channel, std::nullopt, OutputForm::kJson),
             R"({"driver":"HDA","group":"Tx","subgroup":null,"channel":"frames","unit":"frames",)"
             R"("format":"simple","value":96000})");
 }
@@ -61,8 +61,8 @@ TEST(DriversTest, StatesAndBucketsAreShownWithWhatTheyCounted) {
   histogram.format = IOReportFormat::kHistogram;
   histogram.buckets = buckets;
 
-  EXPECT_EQ(formatChannel(state, std::nullopt, EventForm::kText), "-  -  -  -  on=900(3x)");
-  EXPECT_EQ(formatChannel(histogram, std::nullopt, EventForm::kText), "-  -  -  -  0-10:5");
+  EXPECT_EQ(formatChannel(state, std::nullopt, OutputForm::kText), "-  -  -  -  on=900(3x)");
+  EXPECT_EQ(formatChannel(histogram, std::nullopt, OutputForm::kText), "-  -  -  -  0-10:5");
 }
 
 class ShowDriversTest : public testing::Test {
@@ -83,7 +83,7 @@ class ShowDriversTest : public testing::Test {
 };
 
 TEST_F(ShowDriversTest, TheChannelsOfAGroupAreReadFromTheConfiguredSources) {
-  const auto status = showDrivers({.group = "Tx"}, EventForm::kText, out_, -1, errors_);
+  const auto status = showDrivers({.group = "Tx"}, OutputForm::kText, out_, -1, errors_);
 
   EXPECT_EQ(status, ExitStatus::kDone);
   EXPECT_EQ(out_.str(), "-  Tx  -  a  3\n");
@@ -94,7 +94,7 @@ TEST_F(ShowDriversTest, WatchingEndsWhenNobodyReads) {
   ASSERT_EQ(pipe(ends), 0);
   close(ends[0]);
 
-  const auto status = showDrivers({.group = {}, .watch = std::chrono::hours(1)}, EventForm::kText,
+  const auto status = showDrivers({.group = {}, .watch = std::chrono::hours(1)}, OutputForm::kText,
                                   out_, ends[1], errors_);
   close(ends[1]);
 
@@ -105,7 +105,7 @@ TEST_F(ShowDriversTest, WatchingEndsWhenNobodyReads) {
 TEST_F(ShowDriversTest, AWrongConfigurationIsTold) {
   std::ofstream(scratch_.path("halvox.toml")) << "[drivers]\nalsa = 1\n";
 
-  EXPECT_EQ(showDrivers({}, EventForm::kText, out_, -1, errors_), ExitStatus::kBadConfiguration);
+  EXPECT_EQ(showDrivers({}, OutputForm::kText, out_, -1, errors_), ExitStatus::kBadConfiguration);
   EXPECT_NE(errors_.str().find("drivers.alsa"), std::string::npos);
 }
 

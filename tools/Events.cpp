@@ -10,8 +10,8 @@ using platform::linux_::RecordFilter;
 using platform::linux_::StoredEvent;
 using platform::linux_::StoreReader;
 
-std::string formatEvent(const StoredEvent& event, EventForm form) {
-  if (form == EventForm::kText) {
+std::string formatEvent(const StoredEvent& event, OutputForm form) {
+  if (form == OutputForm::kText) {
     return localTime(event.time) + "  " + harmlessText(event.name) + "  " +
            fieldsOfJson(event.payload);
   }
@@ -20,7 +20,7 @@ std::string formatEvent(const StoredEvent& event, EventForm form) {
          ",\"payload\":" + harmlessJson(event.payload) + "}";
 }
 
-ExitStatus showEvents(const ShowEvents& request, EventForm form, std::ostream& out,
+ExitStatus showEvents(const RecordSelection& request, OutputForm form, std::ostream& out,
                       int outputDescriptor, std::ostream& errors) {
   const auto print = [&](const StoredEvent& event) { out << formatEvent(event, form) << '\n'; };
   return runOverStore({"events", request, out, outputDescriptor, errors}, filterOf(request),

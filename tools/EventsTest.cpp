@@ -56,10 +56,10 @@ class EventsTest : public testing::Test {
     store("com.c.fourth", {{"n", 4}});
   }
   // The field n of the events shown, in their order.
-  std::string shown(ShowEvents request) {
+  std::string shown(RecordSelection request) {
     request.database = scratch_.path("state");
     std::ostringstream out;
-    EXPECT_EQ(showEvents(request, EventForm::kText, out, -1, errors_), ExitStatus::kDone);
+    EXPECT_EQ(showEvents(request, OutputForm::kText, out, -1, errors_), ExitStatus::kDone);
     std::string numbers;
     std::istringstream lines(out.str());
     for (std::string line; std::getline(lines, line);) numbers += line.substr(line.find("n=") + 2);
@@ -102,31 +102,31 @@ TEST_F(EventsTest, TheLastAreCountedAfterTheChoice) {
 
 TEST_F(EventsTest, JsonHasTimeNameAndPayload) {
   store("com.a.first", {{"n", 1}, {"text", "\x1B[2J"}});
-  ShowEvents request;
+  RecordSelection request;
   request.database = scratch_.path("state/halvox.db");
   std::ostringstream out;
 
-  EXPECT_EQ(showEvents(request, EventForm::kJson, out, -1, errors_), ExitStatus::kDone);
+  EXPECT_EQ(showEvents(request, OutputForm::kJson, out, -1, errors_), ExitStatus::kDone);
 
   EXPECT_EQ(out.str().substr(0, 44), "{\"time\":100.0,\"name\":\"com.a.first\",\"payload\"");
   EXPECT_EQ(out.str().find('\x1B'), std::string::npos);
 }
 
 TEST_F(EventsTest, AStoreThatIsNotThereIsNoService) {
-  ShowEvents request;
+  RecordSelection request;
   request.database = scratch_.path("elsewhere/halvox.db");
   std::ostringstream out;
 
-  EXPECT_EQ(showEvents(request, EventForm::kText, out, -1, errors_), ExitStatus::kNoService);
+  EXPECT_EQ(showEvents(request, OutputForm::kText, out, -1, errors_), ExitStatus::kNoService);
   EXPECT_NE(errors_.str().find("elsewhere"), std::string::npos);
 }
 
 TEST_F(EventsTest, AnyOtherFileIsABadArgument) {
-  ShowEvents request;
+  RecordSelection request;
   request.database = scratch_.path("state/other.db");
   std::ostringstream out;
 
-  EXPECT_EQ(showEvents(request, EventForm::kText, out, -1, errors_), ExitStatus::kBadArguments);
+  EXPECT_EQ(showEvents(request, OutputForm::kText, out, -1, errors_), ExitStatus::kBadArguments);
 }
 
 TEST_F(EventsTest, ABadConfigurationHasItsOwnStatus) {
@@ -135,7 +135,7 @@ TEST_F(EventsTest, ABadConfigurationHasItsOwnStatus) {
   setenv("HALVOX_CONFIG", configuration.c_str(), 1);
   std::ostringstream out;
 
-  EXPECT_EQ(showEvents({}, EventForm::kText, out, -1, errors_), ExitStatus::kBadConfiguration);
+  EXPECT_EQ(showEvents({}, OutputForm::kText, out, -1, errors_), ExitStatus::kBadConfiguration);
 
   unsetenv("HALVOX_CONFIG");
 }
@@ -147,7 +147,7 @@ TEST_F(EventsTest, TheConfigurationNamesTheStore) {
   setenv("HALVOX_CONFIG", configuration.c_str(), 1);
   std::ostringstream out;
 
-  EXPECT_EQ(showEvents({}, EventForm::kText, out, -1, errors_), ExitStatus::kDone);
+  EXPECT_EQ(showEvents({}, OutputForm::kText, out, -1, errors_), ExitStatus::kDone);
   EXPECT_NE(out.str().find("com.a.first"), std::string::npos);
 
   unsetenv("HALVOX_CONFIG");
@@ -163,10 +163,10 @@ TEST_F(EventsTest, FollowingShowsWhatComesUntilNobodyReads) {
   std::atomic<int> status{-1};
   std::jthread follower([&] {
     std::ofstream out(pipePath);
-    ShowEvents request;
+    RecordSelection request;
     request.follow = true;
     request.database = scratch_.path("state");
-    status = static_cast<int>(showEvents(request, EventForm::kText, out, writeEnd.get(), errors_));
+    status = static_cast<int>(showEvents(request, OutputForm::kText, out, writeEnd.get(), errors_));
   });
 
   std::string seen;
@@ -188,14 +188,15 @@ TEST(FormatEventTest, TextIsOneLineWithLocalTimeNameAndFields) {
   setenv("TZ", "UTC", 1);
   tzset();
 
-  EXPECT_EQ(formatEvent({1, 86'400.25, "com.tarno.test", R"({"a":1,"b":"x y"})"}, EventForm::kText),
-            "1970-01-02 00:00:00.250  com.tarno.test  a=1 b=\"x y\"");
+  EXPECT_EQ(
+      formatEvent({1, 86'400.25, "com.tarno.test", R"({"a":1,"b":"x y"})"}, OutputForm::kText),
+      "1970-01-02 00:00:00.250  com.tarno.test  a=1 b=\"x y\"");
 }
 
 TEST(FormatEventTest, NothingThatAClientSentDrivesTheTerminal) {
   const StoredEvent event{1, 0, "evil\x1B[2J\xC2\x9B", "{\"k\":\"\xC2\x9B\x7F\"}"};
 
-  for (const auto form : {EventForm::kText, EventForm::kJson}) {
+  for (const auto form : {OutputForm::kText, OutputForm::kJson}) {
     const std::string line = formatEvent(event, form);
     EXPECT_EQ(line.find_first_of("\x1B\x7F\n"), std::string::npos);
     EXPECT_EQ(line.find("\xC2\x9B"), std::string::npos);

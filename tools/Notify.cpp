@@ -11,42 +11,35 @@
 
 #include "platform/linux/UniqueHandle.h"
 #include "platform/linux/settings/SettingNames.h"
-#include "tools/JsonText.h"
-#include "tools/SettingsDirectory.h"
+#include "tools/ServiceConfiguration.h"
 
 namespace halvox::tools {
-namespace {
 
 using platform::linux_::Configuration;
 using platform::linux_::UniqueFd;
 
-ExitStatus complain(const std::filesystem::path& path, const std::string& why,
-                    std::ostream& errors) {
-  errors << "halvoxctl notify: " << harmlessText(path.native()) << ": " << why << '\n';
-  return ExitStatus::kCannotWrite;
-}
-
-}  // namespace
-
 ExitStatus postNotification(const PostNotification& request, std::ostream& errors) {
+  const Complaint complain("notify", errors);
   if (!platform::linux_::isUsableName(request.name)) {
-    errors << "halvoxctl notify: NAME: " << platform::linux_::shownName(request.name)
-           << " cannot be a notification; expected the name of a file, without \"/\"\n";
-    return ExitStatus::kBadArguments;
+    return complain(ExitStatus::kBadArguments,
+                    "NAME: " + platform::linux_::shownName(request.name) +
+                        " cannot be a notification; expected the name of a file, without \"/\"");
   }
   const auto found =
-      settingsDirectory(request.directory, &Configuration::notifyDirectory, "notify", errors);
+      settingsDirectory(request.directory, &Configuration::notifyDirectory, complain);
   if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
   const auto& directory = std::get<std::filesystem::path>(found);
   std::error_code error;
   std::filesystem::create_directories(directory, error);
-  if (error) return complain(directory, error.message(), errors);
+  if (error) {
+    return complain(ExitStatus::kCannotWrite, directory.native() + ": " + error.message());
+  }
   const std::filesystem::path file = directory / request.name;
   constexpr int kFlags = O_WRONLY | O_CREAT | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
   const UniqueFd descriptor(::open(file.c_str(), kFlags, 0644));
   // A file that was there is touched, so that its time tells of the last post.
   if (!descriptor || ::futimens(descriptor.get(), nullptr) != 0) {
-    return complain(file, std::strerror(errno), errors);
+    return complain(ExitStatus::kCannotWrite, file.native() + ": " + std::strerror(errno));
   }
   return ExitStatus::kDone;
 }

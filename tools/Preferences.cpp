@@ -11,7 +11,7 @@
 #include "platform/linux/settings/PreferenceWriting.h"
 #include "platform/linux/settings/SettingNames.h"
 #include "tools/JsonText.h"
-#include "tools/SettingsDirectory.h"
+#include "tools/ServiceConfiguration.h"
 
 namespace halvox::tools {
 namespace {
@@ -21,30 +21,22 @@ using platform::linux_::Configuration;
 using platform::linux_::PreferenceFileError;
 using platform::linux_::PreferenceValue;
 
-constexpr const char* kPrefix = "halvoxctl preferences: ";
-
-ExitStatus complain(ExitStatus status, const std::string& why, std::ostream& errors) {
-  errors << kPrefix << harmlessText(why) << '\n';
-  return status;
-}
-
 std::string shown(const Value& value, bool json) {
   if (!json && value.isString()) return harmlessText(value.string());
   return harmlessJson(toJson(value));
 }
 
-ExitStatus nothingThere(const Preferences& request, std::ostream& errors) {
-  return complain(ExitStatus::kRefused,
-                  platform::linux_::shownName(*request.key) + " is not set in " +
-                      platform::linux_::shownName(request.domain),
-                  errors);
+ExitStatus nothingThere(const Preferences& request, const Complaint& complain) {
+  return complain(ExitStatus::kRefused, platform::linux_::shownName(*request.key) +
+                                            " is not set in " +
+                                            platform::linux_::shownName(request.domain));
 }
 
 ExitStatus get(const Preferences& request, const std::filesystem::path& file, bool json,
-               std::ostream& out, std::ostream& errors) {
+               std::ostream& out, const Complaint& complain) {
   const auto content = platform::linux_::readPreferences(file);
   if (const auto* error = std::get_if<PreferenceFileError>(&content)) {
-    return complain(ExitStatus::kCannotWrite, error->description, errors);
+    return complain(ExitStatus::kCannotWrite, error->description);
   }
   const auto& values = std::get<platform::Dictionary>(content);
   if (!request.key.has_value()) {
@@ -58,39 +50,39 @@ ExitStatus get(const Preferences& request, const std::filesystem::path& file, bo
     return ExitStatus::kDone;
   }
   const Value* value = values.find(*request.key);
-  if (value == nullptr) return nothingThere(request, errors);
+  if (value == nullptr) return nothingThere(request, complain);
   out << shown(*value, json) << '\n';
   return ExitStatus::kDone;
 }
 
 ExitStatus change(const std::filesystem::path& file, const platform::linux_::PreferenceEdit& edit,
-                  std::ostream& errors) {
+                  const Complaint& complain) {
   const auto error = platform::linux_::changePreferenceFile(file, edit);
-  if (error.has_value()) return complain(ExitStatus::kCannotWrite, error->description, errors);
+  if (error.has_value()) return complain(ExitStatus::kCannotWrite, error->description);
   return ExitStatus::kDone;
 }
 
 ExitStatus set(const Preferences& request, const std::filesystem::path& file,
-               std::ostream& errors) {
+               const Complaint& complain) {
   auto parsed = platform::linux_::parsePreferenceValue(
       *request.value, request.isString ? platform::linux_::ValueForm::kString
                                        : platform::linux_::ValueForm::kTomlOrString);
   if (const auto* error = std::get_if<PreferenceFileError>(&parsed)) {
-    return complain(ExitStatus::kBadArguments, error->description, errors);
+    return complain(ExitStatus::kBadArguments, error->description);
   }
   return change(
       file,
       [&](std::string_view text, const std::filesystem::path& named) {
         return withPreference(text, *request.key, std::get<PreferenceValue>(parsed), named);
       },
-      errors);
+      complain);
 }
 
 ExitStatus unset(const Preferences& request, const std::filesystem::path& file,
-                 std::ostream& errors) {
+                 const Complaint& complain) {
   // Without a file nothing is made only to be looked into.
   std::error_code ignored;
-  if (!std::filesystem::exists(file, ignored)) return nothingThere(request, errors);
+  if (!std::filesystem::exists(file, ignored)) return nothingThere(request, complain);
   bool wasThere = true;
   const ExitStatus status = change(
       file,
@@ -100,16 +92,17 @@ ExitStatus unset(const Preferences& request, const std::filesystem::path& file,
         wasThere = result == nullptr || *result != text;
         return edited;
       },
-      errors);
-  return wasThere ? status : nothingThere(request, errors);
+      complain);
+  return wasThere ? status : nothingThere(request, complain);
 }
 
 }  // namespace
 
 ExitStatus showOrChangePreferences(const Preferences& request, bool json, std::ostream& out,
                                    std::ostream& errors) {
-  const auto found = settingsDirectory(request.directory, &Configuration::preferencesDirectory,
-                                       "preferences", errors);
+  const Complaint complain("preferences", errors);
+  const auto found =
+      settingsDirectory(request.directory, &Configuration::preferencesDirectory, complain);
   if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
   const auto file = platform::linux_::preferencePath(std::get<std::filesystem::path>(found),
                                                      request.user, request.domain);
@@ -117,16 +110,15 @@ ExitStatus showOrChangePreferences(const Preferences& request, bool json, std::o
     return complain(ExitStatus::kBadArguments,
                     "user " + platform::linux_::shownName(request.user) + ", domain " +
                         platform::linux_::shownName(request.domain) +
-                        ": expected names that a file can have, without \"/\"",
-                    errors);
+                        ": expected names that a file can have, without \"/\"");
   }
   switch (request.action) {
     case Preferences::Action::kGet:
-      return get(request, *file, json, out, errors);
+      return get(request, *file, json, out, complain);
     case Preferences::Action::kSet:
-      return set(request, *file, errors);
+      return set(request, *file, complain);
     case Preferences::Action::kUnset:
-      return unset(request, *file, errors);
+      return unset(request, *file, complain);
   }
   return ExitStatus::kBadArguments;
 }

@@ -25,8 +25,8 @@ class PreferencesTest : public testing::Test {
       errors_ << text->text;
       return text->status;
     }
-    return showOrChangePreferences(std::get<Preferences>(std::get<Command>(parsed).what), json,
-                                   out_, errors_);
+    return showOrChangePreferences(*std::get<Command>(parsed).asked<Preferences>(), json, out_,
+                                   errors_);
   }
   std::string file(const std::string& domain = "d", const std::string& user = "mobile") const {
     return directory_ + "/" + user + "/" + domain + ".toml";

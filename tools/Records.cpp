@@ -182,12 +182,12 @@ RecordFilter filterOf(const ShowRecords& request) {
 
 }  // namespace
 
-std::string formatRecord(ShowRecords::Kind kind, const StoredRecord& record, EventForm form) {
-  return form == EventForm::kJson ? asJson(kind, record)
-                                  : localTime(record.time) + "  " + asText(kind, record);
+std::string formatRecord(ShowRecords::Kind kind, const StoredRecord& record, OutputForm form) {
+  return form == OutputForm::kJson ? asJson(kind, record)
+                                   : localTime(record.time) + "  " + asText(kind, record);
 }
 
-ExitStatus showRecords(const ShowRecords& request, EventForm form, std::ostream& out,
+ExitStatus showRecords(const ShowRecords& request, OutputForm form, std::ostream& out,
                        int outputDescriptor, std::ostream& errors) {
   const RecordTable& table = tableOf(request.kind);
   const auto print = [&](const StoredRecord& record) {

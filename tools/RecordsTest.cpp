@@ -68,14 +68,14 @@ class RecordsTest : public testing::Test {
          .payload = {{"a", 1}}});
   }
   // What is printed for the request, from a store that has all that was added.
-  std::string shown(ShowRecords request, EventForm form = EventForm::kText) {
+  std::string shown(ShowRecords request, OutputForm form = OutputForm::kText) {
     EXPECT_TRUE(client::eventually([this] { return store_->waiting() == 0; }));
     request.selection.database = scratch_.path("state");
     std::ostringstream out;
     EXPECT_EQ(showRecords(request, form, out, -1, errors_), ExitStatus::kDone) << errors_.str();
     return out.str();
   }
-  std::string shown(Kind kind, EventForm form = EventForm::kText) {
+  std::string shown(Kind kind, OutputForm form = OutputForm::kText) {
     return shown(ShowRecords{kind, {}, {}, {}, {}}, form);
   }
 
@@ -93,7 +93,7 @@ TEST_F(RecordsTest, IssueMetricsAreShownByTheirFields) {
   EXPECT_EQ(shown(Kind::kMetrics),
             "1970-01-01 00:01:40.000  0x5B0003  issue_type=xrun node=\"the node\" "
             "rtaid_client=player duration=-5 timestamp=70\n");
-  EXPECT_THAT(shown(Kind::kMetrics, EventForm::kJson),
+  EXPECT_THAT(shown(Kind::kMetrics, OutputForm::kJson),
               HasSubstr(R"("fields":{"issue_type":"xrun","node":"the node",)"
                         R"("rtaid_client":"player","duration":-5,"timestamp":70}})"));
 }
@@ -103,7 +103,7 @@ TEST_F(RecordsTest, OtherMetricsAreShownByTheirBytes) {
   metrics.postIssueMetric(0x7, Issue());
 
   EXPECT_THAT(shown(Kind::kMetrics), HasSubstr("  0x7  0846"));
-  EXPECT_THAT(shown(Kind::kMetrics, EventForm::kJson), Not(HasSubstr("\"fields\"")));
+  EXPECT_THAT(shown(Kind::kMetrics, OutputForm::kJson), Not(HasSubstr("\"fields\"")));
 }
 
 TEST_F(RecordsTest, BytesThatAreNoIssueMetricAreShownAsTheyAre) {
@@ -111,7 +111,7 @@ TEST_F(RecordsTest, BytesThatAreNoIssueMetricAreShownAsTheyAre) {
       {.time = 100, .metricID = kIssueMetric, .message = {std::byte{0x1A}, std::byte{0x05}}});
 
   EXPECT_EQ(shown(Kind::kMetrics), "1970-01-01 00:01:40.000  0x5B0003  1a05\n");
-  EXPECT_EQ(shown(Kind::kMetrics, EventForm::kJson),
+  EXPECT_EQ(shown(Kind::kMetrics, OutputForm::kJson),
             "{\"time\":100.0,\"metric_id\":5963779,\"message\":\"1a05\"}\n");
 }
 
@@ -120,7 +120,7 @@ TEST_F(RecordsTest, PowerEventsAreShownWithCategoryNameAndPayload) {
       {.time = 100, .categoryID = 28, .eventName = "Oxbow", .payload = {{"a", 1}}});
 
   EXPECT_EQ(shown(Kind::kPower), "1970-01-01 00:01:40.000  28  Oxbow  a=1\n");
-  EXPECT_EQ(shown(Kind::kPower, EventForm::kJson),
+  EXPECT_EQ(shown(Kind::kPower, OutputForm::kJson),
             "{\"time\":100.0,\"category_id\":28,\"event_name\":\"Oxbow\",\"payload\":{\"a\":1}}\n");
 }
 
@@ -128,7 +128,7 @@ TEST_F(RecordsTest, LinkMessagesAreShownWithTheirParty) {
   storeLink(100, -1, 3, 9);
 
   EXPECT_EQ(shown(Kind::kLink), "1970-01-01 00:01:40.000  -1  music  3/9  a=1\n");
-  EXPECT_EQ(shown(Kind::kLink, EventForm::kJson),
+  EXPECT_EQ(shown(Kind::kLink, OutputForm::kJson),
             "{\"time\":100.0,\"session_id\":-1,\"client_name\":\"client\",\"service_name\":"
             "\"music\",\"category\":3,\"type\":9,\"payload\":{\"a\":1}}\n");
 }
@@ -137,7 +137,7 @@ TEST_F(RecordsTest, SnapshotsAreShownWithPathAndSignature) {
   store_->snapshots().add({.time = 100, .signature = {{"Type", "haptics"}}, .path = "/s/1.zst"});
 
   EXPECT_EQ(shown(Kind::kSnapshots), "1970-01-01 00:01:40.000  /s/1.zst  Type=haptics\n");
-  EXPECT_EQ(shown(Kind::kSnapshots, EventForm::kJson),
+  EXPECT_EQ(shown(Kind::kSnapshots, OutputForm::kJson),
             "{\"time\":100.0,\"signature\":{\"Type\":\"haptics\"},\"path\":\"/s/1.zst\"}\n");
 }
 
@@ -173,7 +173,7 @@ TEST_F(RecordsTest, NothingThatAClientSentDrivesTheTerminal) {
   store_->snapshots().add({.time = 100, .signature = {{"k", evil}}, .path = evil});
 
   for (const Kind kind : {Kind::kLink, Kind::kPower, Kind::kSnapshots}) {
-    for (const auto form : {EventForm::kText, EventForm::kJson}) {
+    for (const auto form : {OutputForm::kText, OutputForm::kJson}) {
       const std::string line = shown(kind, form);
       EXPECT_EQ(line.find('\x1B'), std::string::npos) << line;
       EXPECT_EQ(line.find("\xC2\x9B"), std::string::npos) << line;
@@ -187,7 +187,7 @@ TEST_F(RecordsTest, AStoreThatIsNotThereIsNamedByTheCommand) {
   request.selection.database = scratch_.path("elsewhere");
   std::ostringstream out;
 
-  EXPECT_NE(showRecords(request, EventForm::kText, out, -1, errors_), ExitStatus::kDone);
+  EXPECT_NE(showRecords(request, OutputForm::kText, out, -1, errors_), ExitStatus::kDone);
   EXPECT_THAT(errors_.str(), HasSubstr("halvoxctl power: "));
 }
 

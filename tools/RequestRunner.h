@@ -6,6 +6,7 @@
 
 #include "client/HalvoxClient.h"
 #include "tools/Command.h"
+#include "tools/Requests.h"
 
 namespace halvox::tools {
 

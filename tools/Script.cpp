@@ -87,7 +87,7 @@ ExitStatus runLine(const std::vector<std::string>& words, RequestRunner& runner,
     return text->status;
   }
   const auto& command = std::get<Command>(parsed);
-  return runner.run(std::get<Request>(command.what), json || command.options.json, prefix);
+  return runner.run(*command.asked<Request>(), json || command.options.json, prefix);
 }
 
 }  // namespace

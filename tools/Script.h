@@ -11,6 +11,13 @@
 
 namespace halvox::tools {
 
+// One request per line, over one connection.
+struct RunScript {
+  std::string file;  // "-": standard input
+  bool keepGoing = false;
+};
+struct RunShell {};
+
 // The words of a line, by the shell's rules for blanks, quotes and backslashes, without any of its
 // expansions. A word that begins with "{" outside of quotes is the rest of the line as it stands,
 // so JSON needs no quotes. "#" at the beginning of a word ends the line.

@@ -13,14 +13,16 @@
 
 #include "platform/linux/diagnostics/SnapshotDirectory.h"
 #include "platform/linux/diagnostics/SnapshotReader.h"
-#include "platform/linux/runtime/Configuration.h"
+#include "tools/Arguments.h"
 #include "tools/JsonText.h"
+#include "tools/ServiceConfiguration.h"
 
 namespace halvox::tools {
 namespace {
 
 namespace fs = std::filesystem;
 
+using platform::Dictionary;
 using platform::Value;
 using platform::linux_::ExistingFiles;
 using platform::linux_::SnapshotReadError;
@@ -28,30 +30,14 @@ using platform::linux_::SnapshotReadError;
 constexpr const char* kSignatureName = "signature.json";
 constexpr const char* kManifestName = "manifest.json";
 
-// Says what is wrong, in the way of the command, and gives the exit status.
-class Complaint {
- public:
-  Complaint(const char* command, std::ostream& errors) : command_(command), errors_(errors) {}
-  ExitStatus operator()(ExitStatus status, const std::string& what) const {
-    errors_ << "halvoxctl snapshots " << command_ << ": " << harmlessText(what) << '\n';
-    return status;
-  }
-
- private:
-  const char* command_;
-  std::ostream& errors_;
-};
-
 // The archive that an argument means, or how the run ends without one.
 std::variant<fs::path, ExitStatus> findSnapshot(const std::string& file,
                                                 const Complaint& complain) {
   if (file != "newest") return fs::path(file);
-  auto loaded = platform::linux_::loadConfiguration();
-  if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
-    return complain(ExitStatus::kBadConfiguration, error->description);
-  }
+  const auto configuration = serviceConfiguration(complain);
+  if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   const platform::linux_::SnapshotDirectory directory(
-      std::get<platform::linux_::Configuration>(loaded).storage.directory);
+      std::get<platform::linux_::Configuration>(configuration).storage.directory);
   const auto all = directory.newestFirst();
   if (all.empty()) {
     return complain(ExitStatus::kNoService, "there is no snapshot in " + directory.path().native());
@@ -145,9 +131,9 @@ std::string stemOf(const fs::path& file) {
 
 }  // namespace
 
-ExitStatus showSnapshot(const ShowSnapshot& request, EventForm form, std::ostream& out,
+ExitStatus showSnapshot(const ShowSnapshot& request, OutputForm form, std::ostream& out,
                         std::ostream& errors) {
-  const Complaint complain("show", errors);
+  const Complaint complain("snapshots show", errors);
   const auto found = findSnapshot(request.file, complain);
   if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
   const auto& file = std::get<fs::path>(found);
@@ -156,7 +142,7 @@ ExitStatus showSnapshot(const ShowSnapshot& request, EventForm form, std::ostrea
     return complain(ExitStatus::kBadArguments, *error);
   }
   const auto& contents = std::get<Contents>(read);
-  if (form == EventForm::kJson) {
+  if (form == OutputForm::kJson) {
     out << harmlessJson(toJson(Dictionary{{"file", file.native()},
                                           {"signature", contents.signature},
                                           {"manifest", contents.manifest}}))
@@ -167,9 +153,9 @@ ExitStatus showSnapshot(const ShowSnapshot& request, EventForm form, std::ostrea
   return ExitStatus::kDone;
 }
 
-ExitStatus extractSnapshot(const ExtractSnapshot& request, EventForm form, std::ostream& out,
+ExitStatus extractSnapshot(const ExtractSnapshot& request, OutputForm form, std::ostream& out,
                            std::ostream& errors) {
-  const Complaint complain("extract", errors);
+  const Complaint complain("snapshots extract", errors);
   const auto found = findSnapshot(request.file, complain);
   if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
   const auto& file = std::get<fs::path>(found);
@@ -181,7 +167,7 @@ ExitStatus extractSnapshot(const ExtractSnapshot& request, EventForm form, std::
   }
   for (const std::string& name : std::get<std::vector<std::string>>(extracted)) {
     const std::string path = (directory / name).native();
-    if (form == EventForm::kJson) {
+    if (form == OutputForm::kJson) {
       out << harmlessJson(toJson(Dictionary{{"file", path}})) << '\n';
     } else {
       out << harmlessText(path) << '\n';

@@ -51,13 +51,13 @@ class SnapshotFilesTest : public ::testing::Test {
     archive.keep();
     return path;
   }
-  ExitStatus show(const std::string& file, EventForm form = EventForm::kText) {
+  ExitStatus show(const std::string& file, OutputForm form = OutputForm::kText) {
     return showSnapshot({.file = file}, form, out_, errors_);
   }
   ExitStatus extract(const std::string& file, bool force = false) {
     return extractSnapshot(
-        {.file = file, .directory = (directory_ / "to").native(), .force = force}, EventForm::kText,
-        out_, errors_);
+        {.file = file, .directory = (directory_ / "to").native(), .force = force},
+        OutputForm::kText, out_, errors_);
   }
 
   fs::path directory_;
@@ -78,7 +78,7 @@ TEST_F(SnapshotFilesTest, NewestMeansTheNewestOfTheServicesStore) {
   archive("20260301T120000Z", "older");
   archive("20260302T120000Z", "newer");
 
-  EXPECT_EQ(show("newest", EventForm::kJson), ExitStatus::kDone);
+  EXPECT_EQ(show("newest", OutputForm::kJson), ExitStatus::kDone);
 
   EXPECT_THAT(out_.str(), HasSubstr(R"("signature":{"DetectedProcess":"newer"})"));
   EXPECT_THAT(out_.str(), HasSubstr(R"("reason":"no pw-dump")"));

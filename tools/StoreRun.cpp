@@ -10,8 +10,7 @@
 
 #include <poll.h>
 
-#include "platform/linux/runtime/Configuration.h"
-#include "tools/JsonText.h"
+#include "tools/ServiceConfiguration.h"
 
 namespace halvox::tools {
 namespace {
@@ -27,14 +26,11 @@ constexpr std::uint64_t kShownWhenFollowing = 10;
 // The directory of the store, or how the run ends without one.
 std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& run) {
   const std::string& database = run.selection.database;
-  std::ostream& errors = run.errors;
+  const Complaint complain(run.command, run.errors);
   if (database.empty()) {
-    auto loaded = platform::linux_::loadConfiguration();
-    if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
-      errors << "halvoxctl " << run.command << ": " << harmlessText(error->description) << '\n';
-      return ExitStatus::kBadConfiguration;
-    }
-    return std::get<platform::linux_::Configuration>(loaded).storage.directory;
+    const auto configuration = serviceConfiguration(complain);
+    if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
+    return std::get<platform::linux_::Configuration>(configuration).storage.directory;
   }
   const std::filesystem::path path(database);
   std::error_code ignored;
@@ -42,14 +38,13 @@ std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& r
   if (path.filename() == kDatabaseName) {
     return path.has_parent_path() ? path.parent_path() : std::filesystem::path(".");
   }
-  errors << "halvoxctl " << run.command << ": --database: " << harmlessText(database)
-         << " is no store; expected a " << kDatabaseName << " or the directory that has one\n";
-  return ExitStatus::kBadArguments;
+  return complain(ExitStatus::kBadArguments, "--database: " + database +
+                                                 " is no store; expected a " + kDatabaseName +
+                                                 " or the directory that has one");
 }
 
-ExitStatus complain(const StoreRun& run, const StoreError& error) {
-  run.errors << "halvoxctl " << run.command << ": " << harmlessText(error.description) << '\n';
-  return ExitStatus::kNoService;
+ExitStatus cannotRead(const StoreRun& run, const StoreError& error) {
+  return Complaint(run.command, run.errors)(ExitStatus::kNoService, error.description);
 }
 
 // Waits for the next records. False when nobody reads the output any more.
@@ -63,11 +58,11 @@ bool waitForRecords(int storeDescriptor, int outputDescriptor) {
 ExitStatus follow(const StoreRun& run, const std::filesystem::path& directory,
                   const RecordFilter& filter, const StoreReading& reading) {
   EventFollower follower;
-  if (const auto error = follower.open(directory, filter)) return complain(run, *error);
+  if (const auto error = follower.open(directory, filter)) return cannotRead(run, *error);
   do {
     const auto error = reading.added(follower);
     run.out << std::flush;
-    if (error) return complain(run, *error);
+    if (error) return cannotRead(run, *error);
   } while (run.out && waitForRecords(follower.descriptor(), run.outputDescriptor));
   return ExitStatus::kDone;
 }
@@ -89,7 +84,7 @@ std::string localTime(double seconds) {
   return std::string(date.data()) + fraction.data();
 }
 
-RecordFilter filterOf(const ShowEvents& selection) {
+RecordFilter filterOf(const RecordSelection& selection) {
   RecordFilter filter;
   filter.names = selection.names;
   filter.since = selection.since;
@@ -107,10 +102,10 @@ ExitStatus runOverStore(const StoreRun& run, const RecordFilter& filter,
   if (run.selection.follow) return follow(run, path, filter, reading);
 
   StoreReader reader;
-  if (const auto error = reader.open(path)) return complain(run, *error);
+  if (const auto error = reader.open(path)) return cannotRead(run, *error);
   const auto error = reading.all(reader, filter);
   run.out << std::flush;
-  return error ? complain(run, *error) : ExitStatus::kDone;
+  return error ? cannotRead(run, *error) : ExitStatus::kDone;
 }
 
 }  // namespace halvox::tools

@@ -1,9 +1,11 @@
 #pragma once
 
+#include <cstdint>
 #include <functional>
 #include <optional>
 #include <ostream>
 #include <string>
+#include <vector>
 
 #include "platform/linux/store/EventFollower.h"
 #include "platform/linux/store/StoreReader.h"
@@ -11,10 +13,20 @@
 
 namespace halvox::tools {
 
+// Which stored records a command shows.
+struct RecordSelection {
+  std::vector<std::string> names{};  // glob patterns; none: all
+  std::optional<double> since{};     // seconds since 1970
+  std::optional<double> until{};
+  std::optional<std::uint64_t> last{};
+  bool follow = false;
+  std::string database{};  // empty: where the service's configuration puts it
+};
+
 // What a command that shows stored records of one kind is run with.
 struct StoreRun {
   std::string command;  // for the complaints
-  const ShowEvents& selection;
+  const RecordSelection& selection;
   std::ostream& out;
   int outputDescriptor;  // what `out` writes to
   std::ostream& errors;
@@ -28,7 +40,7 @@ struct StoreReading {
 };
 
 // What the selection asks for, as the store's reader has it.
-platform::linux_::RecordFilter filterOf(const ShowEvents& selection);
+platform::linux_::RecordFilter filterOf(const RecordSelection& selection);
 
 // Opens the store that the selection names and reads it, once or, with --follow, until the output
 // is closed or the store's directory is gone.

@@ -8,8 +8,8 @@
 #include <utility>
 #include <variant>
 
-#include "platform/linux/runtime/Configuration.h"
 #include "tools/JsonText.h"
+#include "tools/ServiceConfiguration.h"
 #include "tools/SummaryReader.h"
 
 namespace halvox::tools {
@@ -19,7 +19,6 @@ namespace fs = std::filesystem;
 
 constexpr const char* kDirectory =
     "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
-constexpr const char* kPrefix = "halvoxctl summary: ";
 
 using Row = std::array<std::string, 6>;
 
@@ -75,9 +74,9 @@ std::string jsonOf(const Session& session) {
   return json + ",\"volume_intervals\":" + std::to_string(session.totals.volumeIntervals) + "}";
 }
 
-void printMessage(std::string_view identifier, std::string_view message, EventForm form,
+void printMessage(std::string_view identifier, std::string_view message, OutputForm form,
                   std::ostream& out) {
-  if (form == EventForm::kText) {
+  if (form == OutputForm::kText) {
     out << harmlessText(identifier) << "  " << fieldsOfJson(message) << '\n';
   } else {
     out << "{\"identifier\":" << harmlessJson(quoted(identifier))
@@ -86,21 +85,21 @@ void printMessage(std::string_view identifier, std::string_view message, EventFo
 }
 
 bool read(const std::string& file, const SummaryMessageHandler& handler, Session& session,
-          std::ostream& errors) {
+          const Complaint& complain) {
   session.file = file;
   session.name = parseSummaryName(fs::path(file).filename().string()).value_or(SummaryName{});
   std::string error;
   if (readSummary(file, handler, session.totals, error)) return true;
-  errors << kPrefix << harmlessText(file) << ": " << harmlessText(error) << '\n';
+  complain(ExitStatus::kBadArguments, file + ": " + error);
   return false;
 }
 
 // The table stands before the messages and needs all of them, so the file is read twice.
-ExitStatus showOne(const std::string& file, EventForm form, std::ostream& out,
-                   std::ostream& errors) {
+ExitStatus showOne(const std::string& file, OutputForm form, std::ostream& out,
+                   const Complaint& complain) {
   Session session;
-  if (!read(file, nullptr, session, errors)) return ExitStatus::kBadArguments;
-  if (form == EventForm::kText) {
+  if (!read(file, nullptr, session, complain)) return ExitStatus::kBadArguments;
+  if (form == OutputForm::kText) {
     printTable({session}, out);
     out << '\n';
   } else {
@@ -110,18 +109,18 @@ ExitStatus showOne(const std::string& file, EventForm form, std::ostream& out,
   const auto print = [&](std::string_view identifier, std::string_view message) {
     printMessage(identifier, message, form, out);
   };
-  return read(file, print, again, errors) ? ExitStatus::kDone : ExitStatus::kBadArguments;
+  return read(file, print, again, complain) ? ExitStatus::kDone : ExitStatus::kBadArguments;
 }
 
 // What is shown when some files are broken is still worth showing.
-ExitStatus showTable(const std::vector<std::string>& files, EventForm form, std::ostream& out,
-                     std::ostream& errors) {
+ExitStatus showTable(const std::vector<std::string>& files, OutputForm form, std::ostream& out,
+                     const Complaint& complain) {
   std::vector<Session> sessions;
   for (const std::string& file : files) {
     Session session;
-    if (read(file, nullptr, session, errors)) sessions.push_back(std::move(session));
+    if (read(file, nullptr, session, complain)) sessions.push_back(std::move(session));
   }
-  if (form == EventForm::kJson) {
+  if (form == OutputForm::kJson) {
     for (const Session& session : sessions) out << jsonOf(session) << '\n';
   } else if (!sessions.empty()) {
     printTable(sessions, out);
@@ -146,33 +145,30 @@ std::vector<std::string> newestIn(const fs::path& directory, std::uint64_t count
   return files;
 }
 
-ExitStatus showNewest(std::uint64_t count, EventForm form, std::ostream& out,
-                      std::ostream& errors) {
-  auto loaded = platform::linux_::loadConfiguration();
-  if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
-    errors << kPrefix << harmlessText(error->description) << '\n';
-    return ExitStatus::kBadConfiguration;
-  }
+ExitStatus showNewest(std::uint64_t count, OutputForm form, std::ostream& out,
+                      const Complaint& complain) {
+  const auto configuration = serviceConfiguration(complain);
+  if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   const fs::path directory =
-      std::get<platform::linux_::Configuration>(loaded).storage.root / kDirectory;
+      std::get<platform::linux_::Configuration>(configuration).storage.root / kDirectory;
   std::error_code error;
   const auto files = newestIn(directory, count, error);
   if (error || (files.empty() && count > 0)) {
-    errors << kPrefix << harmlessText(directory.string()) << ": "
-           << (error ? error.message() : "has no summaries")
-           << "; the service leaves them on internal builds only\n";
-    return ExitStatus::kNoService;
+    return complain(ExitStatus::kNoService,
+                    directory.string() + ": " + (error ? error.message() : "has no summaries") +
+                        "; the service leaves them on internal builds only");
   }
-  return showTable(files, form, out, errors);
+  return showTable(files, form, out, complain);
 }
 
 }  // namespace
 
-ExitStatus showSummaries(const ShowSummaries& request, EventForm form, std::ostream& out,
+ExitStatus showSummaries(const ShowSummaries& request, OutputForm form, std::ostream& out,
                          std::ostream& errors) {
-  if (request.files.empty()) return showNewest(request.last, form, out, errors);
-  if (request.files.size() == 1) return showOne(request.files.front(), form, out, errors);
-  return showTable(request.files, form, out, errors);
+  const Complaint complain("summary", errors);
+  if (request.files.empty()) return showNewest(request.last, form, out, complain);
+  if (request.files.size() == 1) return showOne(request.files.front(), form, out, complain);
+  return showTable(request.files, form, out, complain);
 }
 
 }  // namespace halvox::tools

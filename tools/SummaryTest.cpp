@@ -49,7 +49,7 @@ class SummaryTest : public testing::Test {
     std::ofstream(scratch_ / name) << text;
     return (scratch_ / name).string();
   }
-  ExitStatus show(std::vector<std::string> files, EventForm form = EventForm::kText,
+  ExitStatus show(std::vector<std::string> files, OutputForm form = OutputForm::kText,
                   std::uint64_t last = 10) {
     out_.str("");
     errors_.str("");
@@ -105,7 +105,7 @@ TEST_F(SummaryTest, OneFileIsShownWithItsMessages) {
 TEST_F(SummaryTest, JsonIsOneObjectALine) {
   const std::string file = write("other.json", R"([{"A": {"b": "c"}}])");
 
-  EXPECT_EQ(show({file}, EventForm::kJson), ExitStatus::kDone);
+  EXPECT_EQ(show({file}, OutputForm::kJson), ExitStatus::kDone);
 
   EXPECT_EQ(out_.str(), "{\"file\":\"" + file +
                             "\",\"time\":\"\",\"application\":\"\",\"service\":\"\",\"messages\":1,"
@@ -120,7 +120,7 @@ TEST_F(SummaryTest, NewestOfTheStoreAreShownNewestLast) {
   write(store / "20231114-203000-0200-halvox-third-haptics.json", "[]");
   write(store / "notes.txt", "");
 
-  EXPECT_EQ(show({}, EventForm::kText, 2), ExitStatus::kDone);
+  EXPECT_EQ(show({}, OutputForm::kText, 2), ExitStatus::kDone);
 
   const std::string shown = out_.str();
   EXPECT_EQ(shown.find("first"), std::string::npos);

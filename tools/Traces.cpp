@@ -19,8 +19,8 @@
 
 #include "client/HalvoxClient.h"
 #include "client/Vocabulary.h"
-#include "platform/linux/runtime/Configuration.h"
 #include "tools/JsonText.h"
+#include "tools/ServiceConfiguration.h"
 #include "tools/TraceResults.h"
 
 namespace halvox::tools {
@@ -28,13 +28,13 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr const char* kPrefix = "halvoxctl trace: ";
 constexpr const char* kResultsFile =
     "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Traces/tracing_results.ssj";
-constexpr ServiceType kTestService = 11;
+constexpr client::ServiceType kTestService = 11;
 // The stop is answered when the trace has been read back.
 constexpr std::chrono::minutes kStopWithin{10};
 
+using platform::Dictionary;
 using Row = std::array<std::string, 6>;
 
 std::string microseconds(double nanoseconds) {
@@ -81,11 +81,6 @@ void printJson(const TraceResults& results, std::ostream& out) {
   }
 }
 
-ExitStatus complain(std::ostream& errors, const std::string& what, ExitStatus status) {
-  errors << kPrefix << harmlessText(what) << '\n';
-  return status;
-}
-
 // Which file it is and when it was written; a new file is another one.
 std::pair<ino_t, std::int64_t> identityOf(const fs::path& file) {
   struct stat status {};
@@ -123,7 +118,7 @@ class TracedSession {
 
  private:
   // Sessions are of their client, so the number need only be none of its other ones.
-  const ReporterID id_ = ::getpid();
+  const client::ReporterID id_ = ::getpid();
   const std::unique_ptr<client::HalvoxConnection> connection_;
 };
 
@@ -149,61 +144,60 @@ std::string runProgram(std::vector<std::string> command) {
 
 ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options, std::ostream& out,
                        std::ostream& errors) {
-  auto loaded = platform::linux_::loadConfiguration();
-  if (const auto* error = std::get_if<platform::linux_::ConfigurationError>(&loaded)) {
-    return complain(errors, error->description, ExitStatus::kBadConfiguration);
-  }
+  const Complaint complain("trace record", errors);
+  const auto configuration = serviceConfiguration(complain);
+  if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   const fs::path results =
-      std::get<platform::linux_::Configuration>(loaded).storage.root / kResultsFile;
+      std::get<platform::linux_::Configuration>(configuration).storage.root / kResultsFile;
   const std::string params = fs::absolute(request.params).string();
   if (::access(params.c_str(), R_OK) != 0) {
-    return complain(errors, params + ": " + std::strerror(errno), ExitStatus::kBadArguments);
+    return complain(ExitStatus::kBadArguments, params + ": " + std::strerror(errno));
   }
   const auto before = identityOf(results);
   auto opened = client::HalvoxConnection::open(
       options.socket, std::max<std::chrono::milliseconds>(options.timeout, kStopWithin));
-  if (!opened) return complain(errors, opened.failure->message, ExitStatus::kNoService);
+  if (!opened) return complain(ExitStatus::kNoService, opened.failure->message);
   TracedSession session(std::move(*opened.value));
   if (const std::string failure = session.start(params); !failure.empty()) {
-    return complain(errors, failure, ExitStatus::kRefused);
+    return complain(ExitStatus::kRefused, failure);
   }
   const std::string ofProgram = runProgram(request.command);
   if (const std::string failure = session.stop(); !failure.empty()) {
-    return complain(errors, failure, ExitStatus::kRefused);
+    return complain(ExitStatus::kRefused, failure);
   }
-  if (!ofProgram.empty()) complain(errors, ofProgram, ExitStatus::kRefused);
+  if (!ofProgram.empty()) complain(ExitStatus::kRefused, ofProgram);
   if (identityOf(results) == before) {
-    return complain(errors,
+    return complain(ExitStatus::kRefused,
                     "the service left no new results in " + results.string() +
-                        "; it traces when Tracing is on in [features.Acoustat]",
-                    ExitStatus::kRefused);
+                        "; it traces when Tracing is on in [features.Acoustat]");
   }
-  const EventForm form = options.json ? EventForm::kJson : EventForm::kText;
-  const ExitStatus shown = showTrace({results.string()}, form, out, errors);
+  const ExitStatus shown = showTrace({results.string()}, options.form(), out, errors);
   return ofProgram.empty() ? shown : ExitStatus::kRefused;
 }
 
-ExitStatus showTrace(const ShowTrace& request, EventForm form, std::ostream& out,
+ExitStatus showTrace(const ShowTrace& request, OutputForm form, std::ostream& out,
                      std::ostream& errors) {
+  const Complaint complain("trace show", errors);
   const auto read = readTraceResults(request.file);
   if (const auto* error = std::get_if<std::string>(&read)) {
-    return complain(errors, request.file + ": " + *error, ExitStatus::kBadArguments);
+    return complain(ExitStatus::kBadArguments, request.file + ": " + *error);
   }
   const auto& results = std::get<TraceResults>(read);
-  form == EventForm::kJson ? printJson(results, out) : printTable(results, out);
+  form == OutputForm::kJson ? printJson(results, out) : printTable(results, out);
   return ExitStatus::kDone;
 }
 
 ExitStatus exportTrace(const ExportTrace& request, std::ostream& errors) {
+  const Complaint complain("trace export", errors);
   const auto read = readTraceResults(request.file);
   if (const auto* error = std::get_if<std::string>(&read)) {
-    return complain(errors, request.file + ": " + *error, ExitStatus::kBadArguments);
+    return complain(ExitStatus::kBadArguments, request.file + ": " + *error);
   }
   std::ofstream out(request.to);
   if (out) writeTraceEvents(std::get<TraceResults>(read), out);
   out.close();
   if (out) return ExitStatus::kDone;
-  return complain(errors, request.to + ": " + std::strerror(errno), ExitStatus::kCannotWrite);
+  return complain(ExitStatus::kCannotWrite, request.to + ": " + std::strerror(errno));
 }
 
 }  // namespace halvox::tools

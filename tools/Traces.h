@@ -1,11 +1,24 @@
 #pragma once
 
 #include <ostream>
+#include <string>
+#include <vector>
 
 #include "tools/Command.h"
-#include "tools/Events.h"
 
 namespace halvox::tools {
+
+struct RecordTrace {
+  std::string params{};                // the trace parameters file
+  std::vector<std::string> command{};  // the program and its arguments
+};
+struct ShowTrace {
+  std::string file{};
+};
+struct ExportTrace {
+  std::string file{};
+  std::string to{};
+};
 
 // Has the service trace while a program runs, and prints what was measured. The service must be one
 // whose configuration this is and trace at all. Fails when the program does, when the service
@@ -15,7 +28,7 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
 
 // Prints for each measurement of a results file how many values it has and which; as JSON, one
 // object a line.
-ExitStatus showTrace(const ShowTrace& request, EventForm form, std::ostream& out,
+ExitStatus showTrace(const ShowTrace& request, OutputForm form, std::ostream& out,
                      std::ostream& errors);
 
 // Writes the intervals of a results file in the Trace Event form: a track for each measurement, on

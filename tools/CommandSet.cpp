@@ -1,0 +1,73 @@
+#include "tools/CommandSet.h"
+
+#include <iterator>
+
+namespace halvox::tools {
+
+CommandSet::CommandSet(CLI::App& app, CommandSource source, std::istream& input)
+    : app_(app), source_(source), input_(input) {
+  if (source_ == CommandSource::kArguments) addCommonOptions(app_, CommandReach::kService);
+}
+
+CLI::App& CommandSet::add(const CommandText& text) {
+  CLI::App& app = addBelow(app_, text);
+  app.group(heading_);
+  return app;
+}
+
+CLI::App& CommandSet::addBelow(CLI::App& parent, const CommandText& text) {
+  CLI::App* app = parent.add_subcommand(text.name, text.summary);
+  app->group("Commands");
+  addCommonOptions(*app, text.reach);
+  app->footer((text.details.empty() ? "" : text.details + "\n\n") + "Example:\n  " + text.example);
+  return *app;
+}
+
+void CommandSet::addCommonOptions(CLI::App& app, CommandReach reach) {
+  app.add_flag("--json", options_.json, "Print JSON, one object a line");
+  if (source_ == CommandSource::kScriptLine) return;
+  auto* socket = app.add_option("--socket", options_.socket,
+                                "The service's socket (default: $HALVOX_SOCKET, else "
+                                "$XDG_RUNTIME_DIR/halvox/reporting.sock, else "
+                                "/run/halvox/reporting.sock)")
+                     ->type_name("PATH");
+  auto* timeout = addParsed(app, "--timeout", options_.timeout, parseSeconds,
+                            "How long to wait for an answer (default: 5)")
+                      ->type_name("SECONDS");
+  if (reach == CommandReach::kService) return;
+  // Taken everywhere, so that an alias may carry them; told only where they matter.
+  socket->group("");
+  timeout->group("");
+}
+
+std::string CommandSet::readInput() {
+  if (source_ == CommandSource::kScriptLine) {
+    throw CLI::ValidationError("JSON", "\"-\" is for single commands; in a script, write it out");
+  }
+  return {std::istreambuf_iterator<char>(input_), {}};
+}
+
+Command CommandSet::take() {
+  Command command = *std::move(command_);
+  command_.reset();
+  command.options = options_;
+  return command;
+}
+
+CLI::Option* addOptionalSeconds(CLI::App& app, const std::string& name,
+                                std::function<void(std::optional<std::chrono::milliseconds>)> given,
+                                const std::string& description) {
+  return app
+      .add_option_function<std::vector<std::string>>(
+          name,
+          [given = std::move(given), name](const std::vector<std::string>& texts) {
+            const bool isBare = texts.empty() || texts.front().empty();
+            given(isBare ? std::nullopt
+                         : std::optional(valueOf(parseSeconds(texts.front()), name)));
+          },
+          description)
+      ->expected(0, 1)
+      ->type_name("SECONDS");
+}
+
+}  // namespace halvox::tools

@@ -1,0 +1,106 @@
+#include <cstdint>
+#include <memory>
+#include <vector>
+
+#include "tools/Events.h"
+#include "tools/Records.h"
+#include "tools/commands/Commands.h"
+#include "tools/commands/Selection.h"
+
+namespace halvox::tools {
+namespace {
+
+using Kind = ShowRecords::Kind;
+
+ExitStatus runEvents(const RecordSelection& selection, const CommonOptions& options,
+                     const ToolStreams& streams) {
+  return showEvents(selection, options.form(), streams.output, streams.outputDescriptor,
+                    streams.errors);
+}
+
+ExitStatus runRecords(const ShowRecords& request, const CommonOptions& options,
+                      const ToolStreams& streams) {
+  return showRecords(request, options.form(), streams.output, streams.outputDescriptor,
+                     streams.errors);
+}
+
+void addNumbers(CLI::App& app, const char* name, std::vector<std::int64_t>& numbers,
+                const char* description) {
+  addEach(app, name, numbers, parseNumber, description)->type_name("N");
+}
+
+// A command that shows the records of one kind; `request` is what its options are read into.
+CLI::App& addRecords(CommandSet& commands, const CommandText& text,
+                     const std::shared_ptr<ShowRecords>& request) {
+  CLI::App& app = commands.add(text);
+  commands.onRun(
+      app, [request] { return *request; }, runRecords);
+  return app;
+}
+
+std::shared_ptr<ShowRecords> makeRequest(Kind kind) {
+  auto request = std::make_shared<ShowRecords>();
+  request->kind = kind;
+  return request;
+}
+
+void addEvents(CommandSet& commands) {
+  const auto selection = std::make_shared<RecordSelection>();
+  CLI::App& events =
+      commands.add({.name = "events",
+                    .summary = "Show the events that the service stored, newest last",
+                    .example = "halvoxctl events --name 'com.tarno.*' --since 5m --follow",
+                    .reach = CommandReach::kFiles});
+  addSelection(events, *selection, "events", "--name");
+  commands.onRun(
+      events, [selection] { return *selection; }, runEvents);
+}
+
+void addMetrics(CommandSet& commands) {
+  const auto request = makeRequest(Kind::kMetrics);
+  CLI::App& metrics = addRecords(commands,
+                                 {.name = "metrics",
+                                  .summary = "Show the issue metrics that the service stored",
+                                  .example = "halvoxctl metrics --id 0x5B0003 --last 5",
+                                  .reach = CommandReach::kFiles},
+                                 request);
+  addNumbers(metrics, "--id", request->ids, "Only metrics of this identifier");
+  addSelection(metrics, request->selection, "metrics", nullptr);
+}
+
+void addPower(CommandSet& commands) {
+  const auto request = makeRequest(Kind::kPower);
+  CLI::App& power = addRecords(commands,
+                               {.name = "power",
+                                .summary = "Show the power events that the service stored",
+                                .example = "halvoxctl power --name 'Oxbow*' --since 1h",
+                                .reach = CommandReach::kFiles},
+                               request);
+  addNumbers(power, "--category", request->categories, "Only events of this category");
+  addSelection(power, request->selection, "power events", "--name");
+}
+
+void addLink(CommandSet& commands) {
+  const auto request = makeRequest(Kind::kLink);
+  CLI::App& link = addRecords(commands,
+                              {.name = "link",
+                               .summary = "Show the messages that the link's local back-end stored",
+                               .example = "halvoxctl link --session 7 --follow",
+                               .reach = CommandReach::kFiles},
+                              request);
+  addNumbers(link, "--session", request->ids, "Only messages of this session (-1: of none)");
+  addNumbers(link, "--category", request->categories, "Only messages of this category");
+  addNumbers(link, "--type", request->types, "Only messages of this type");
+  addSelection(link, request->selection, "messages", "--service");
+}
+
+}  // namespace
+
+void addRecordCommands(CommandSet& commands) {
+  addEvents(commands);
+  addMetrics(commands);
+  addPower(commands);
+  addLink(commands);
+}
+
+}  // namespace halvox::tools

@@ -1,0 +1,67 @@
+#include <cerrno>
+#include <cstring>
+#include <fstream>
+#include <memory>
+
+#include "tools/Complaint.h"
+#include "tools/Script.h"
+#include "tools/commands/Commands.h"
+
+namespace halvox::tools {
+namespace {
+
+constexpr const char* kScriptNote =
+    "The lines are as the arguments of halvoxctl, quoted as in a shell; a JSON object at the end "
+    "of a line needs no quotes. # begins a comment line.\nBesides the requests there are 'wait ID "
+    "[SECONDS]' (for the answer to a start) and 'sleep SECONDS'.\nEnds at the first line that "
+    "fails, with its status.";
+
+ExitStatus runFile(const RunScript& script, const CommonOptions& options,
+                   const ToolStreams& streams) {
+  if (script.file == "-") {
+    return runScript({streams.input, "standard input", false, script.keepGoing}, options,
+                     streams.output, streams.errors);
+  }
+  std::ifstream file(script.file);
+  // A directory opens but cannot be read.
+  if (file) (void)file.peek();
+  if (file.bad() || !file.is_open()) {
+    return Complaint("run", streams.errors)(
+        ExitStatus::kBadArguments,
+        "FILE: cannot read " + script.file + ": " + std::strerror(errno));
+  }
+  return runScript({file, harmlessText(script.file), false, script.keepGoing}, options,
+                   streams.output, streams.errors);
+}
+
+ExitStatus runTypedLines(const RunShell& /*shell*/, const CommonOptions& options,
+                         const ToolStreams& streams) {
+  return runScript({streams.input, "line", streams.isInputTerminal, true}, options, streams.output,
+                   streams.errors);
+}
+
+}  // namespace
+
+void addScriptCommands(CommandSet& commands) {
+  const auto script = std::make_shared<RunScript>();
+  CLI::App& run =
+      commands.add({.name = "run",
+                    .summary = "Carry out a file of commands, one a line, over one connection",
+                    .example = "printf 'create 7\\nstart 7\\nstop 7\\n' | halvoxctl run -",
+                    .details = kScriptNote});
+  run.add_option("FILE", script->file, "The file; \"-\" reads standard input")->required();
+  run.add_flag("--keep-going", script->keepGoing, "Go on behind lines that fail");
+  commands.onRun(
+      run, [script] { return *script; }, runFile);
+
+  CLI::App& shell =
+      commands.add({.name = "shell",
+                    .summary = "Read commands as you type them, over one connection",
+                    .example = "halvoxctl shell",
+                    .details = "Sessions live until you leave. 'help' lists the commands, 'quit' "
+                               "or the end of the input leaves."});
+  commands.onRun(
+      shell, [] { return RunShell{}; }, runTypedLines);
+}
+
+}  // namespace halvox::tools

@@ -1,0 +1,85 @@
+#include <memory>
+
+#include "tools/Notify.h"
+#include "tools/Preferences.h"
+#include "tools/commands/Commands.h"
+
+namespace halvox::tools {
+namespace {
+
+using Action = Preferences::Action;
+
+Parsed<Action> parseAction(std::string_view text) {
+  if (text == "get") return Action::kGet;
+  if (text == "set") return Action::kSet;
+  if (text == "unset") return Action::kUnset;
+  return ArgumentError{"\"" + std::string(text) + "\" is not known; expected get, set or unset"};
+}
+
+Preferences checked(const Preferences& request) {
+  if (request.action != Action::kGet && !request.key.has_value()) {
+    throw CLI::ValidationError("KEY", "is missing; expected the key to change");
+  }
+  if ((request.action == Action::kSet) != request.value.has_value()) {
+    throw CLI::ValidationError("VALUE", request.value.has_value()
+                                            ? "goes with set only"
+                                            : "is missing; expected what to set the key to");
+  }
+  return request;
+}
+
+void addPreferences(CommandSet& commands) {
+  const auto request = std::make_shared<Preferences>();
+  CLI::App& preferences = commands.add(
+      {.name = "preferences",
+       .summary = "Show or change settings that the service follows while it runs",
+       .example = "halvoxctl preferences set com.tarno.halvox device_name Kitchen",
+       .details = "A set or unset leaves everything else in the file as it is, comments too. "
+                  "Tables with lines of their own cannot be changed so; edit the file instead.\nA "
+                  "VALUE that begins with - comes behind a -- of its own.",
+       .reach = CommandReach::kFiles});
+  addParsed(preferences, "ACTION", request->action, parseAction, "get, set or unset")->required();
+  preferences.add_option("DOMAIN", request->domain, "A domain, such as com.tarno.halvox")
+      ->required();
+  preferences.add_option("KEY", request->key, "A key; to get all, none");
+  preferences.add_option("VALUE", request->value,
+                         "A TOML value; what is none is taken as a string");
+  preferences.add_flag("--string", request->isString, "Take VALUE as a string in any case");
+  preferences.add_option("--user", request->user, "Whose settings (default: mobile)")
+      ->type_name("USER");
+  preferences
+      .add_option("--directory", request->directory,
+                  "Where the preferences are (default: as the service's configuration says)")
+      ->type_name("DIRECTORY");
+  commands.onRun(
+      preferences, [request] { return checked(*request); },
+      [](const Preferences& asked, const CommonOptions& options, const ToolStreams& streams) {
+        return showOrChangePreferences(asked, options.json, streams.output, streams.errors);
+      });
+}
+
+void addNotify(CommandSet& commands) {
+  const auto request = std::make_shared<PostNotification>();
+  CLI::App& notify = commands.add({.name = "notify",
+                                   .summary = "Post a notification to the service",
+                                   .example = "halvoxctl notify com.tarno.halvox.reporting",
+                                   .reach = CommandReach::kFiles});
+  notify.add_option("NAME", request->name, "The notification")->required();
+  notify
+      .add_option("--directory", request->directory,
+                  "Where the service looks for notifications (default: as its configuration says)")
+      ->type_name("DIRECTORY");
+  commands.onRun(
+      notify, [request] { return *request; },
+      [](const PostNotification& asked, const CommonOptions& /*options*/,
+         const ToolStreams& streams) { return postNotification(asked, streams.errors); });
+}
+
+}  // namespace
+
+void addSettingsCommands(CommandSet& commands) {
+  addPreferences(commands);
+  addNotify(commands);
+}
+
+}  // namespace halvox::tools
