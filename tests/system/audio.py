@@ -59,14 +59,20 @@ class Audio:
         if line != word:
             raise AssertionError(f"the private PipeWire said {line!r} instead of {word!r}")
 
-    def tone(self, seconds, rate=48000):
+    def tone(self, seconds, rate=48000, pitch=440):
         path = self.directory / f"tone-{seconds}.wav"
-        samples = (int(16000 * math.sin(2 * math.pi * 440 * i / rate)) for i in range(int(seconds * rate)))
+        if path.exists():
+            return path
+        # A whole number of waves, again and again.
+        period = rate // math.gcd(rate, pitch)
+        wave_form = struct.pack(f"<{period}h", *(int(16000 * math.sin(2 * math.pi * pitch * i / rate))
+                                                 for i in range(period)))
+        frames = int(seconds * rate)
         with wave.open(str(path), "wb") as file:
             file.setnchannels(1)
             file.setsampwidth(2)
             file.setframerate(rate)
-            file.writeframes(b"".join(struct.pack("<h", sample) for sample in samples))
+            file.writeframes((wave_form * (frames // period + 1))[:2 * frames])
         return path
 
     def run(self, *command):

@@ -99,6 +99,7 @@ class DriverStatisticsTest(unittest.TestCase):
     def test_a_session_that_spans_a_playback_ends_with_what_the_sink_counted(self):
         require("pw-profiler")
         self.wait_for_sink("idle", "suspended")
+        self.audio.tone(SECONDS)
         self.start_session(1)
         start = time.monotonic()
         length = self.cycle_length(self.play(SECONDS))
@@ -108,12 +109,14 @@ class DriverStatisticsTest(unittest.TestCase):
         self.wait_until_all_is_told()
         self.end_session(1)
 
-        cycles = self.wait_for_statistics("Simple")[SINK + "Simple_cycles"]
+        simple = self.wait_for_statistics("Simple")
+        cycles = simple[SINK + "Simple_cycles"]
         self.assertGreaterEqual(cycles * length, 0.95 * SECONDS)
         self.assertLessEqual(cycles * length, 1.05 * longest)
-        self.check_histogram("busytime", cycles)
-        self.check_histogram("waittime", cycles)
-        self.check_state(cycles * length)
+        xruns = simple.get(SINK + "Simple_xruns", 0)
+        self.check_histogram("busytime", cycles, xruns)
+        self.check_histogram("waittime", cycles, xruns)
+        self.check_state(cycles * length, longest)
         self.check_link()
 
     def check_link(self):
@@ -131,26 +134,29 @@ class DriverStatisticsTest(unittest.TestCase):
             self.assertEqual({key: messages[number][key] for key in stored if key.startswith(SINK)},
                              {key: value for key, value in stored.items() if key.startswith(SINK)})
 
-    def check_histogram(self, name, cycles):
+    def check_histogram(self, name, cycles, xruns):
         text = self.wait_for_statistics("Histogram")[SINK + f"Histogram_{name}"]
         head, buckets = re.fullmatch(
             r"count=11,lower=0,upper=9223372036854775807,(min=\d+,max=\d+),unit=us::(.+)", text).groups()
         smallest, greatest = (int(part.split("=")[1]) for part in head.split(","))
         parts = [re.fullmatch(r"(\d+)-(\d+):(\d+)", part).groups() for part in buckets.split(";")]
         lower, upper, hits = zip(*((int(number) for number in part) for part in parts))
-        # The first cycle of a node has no times.
-        self.assertLessEqual(abs(sum(hits) - cycles), 2, text)
+        # The first cycle of a node has no times, and one that was missed may have none.
+        self.assertLessEqual(sum(hits), cycles, text)
+        self.assertGreaterEqual(sum(hits), cycles - 2 - xruns, text)
         self.assertTrue(lower[0] <= smallest <= greatest < upper[-1], text)
 
-    def check_state(self, seconds):
+    def check_state(self, seconds, longest):
         text = self.wait_for_statistics("State")[SINK + "State_state"]
         states = {name: (int(transitions), int(residency) / 1e6, float(duty)) for
                   name, transitions, residency, duty in re.findall(
                       r"name:(\w+),transition:(\d+),residency:(\d+),duty_cycle:([\d.]+);", text)}
         transitions, residency, duty = states["running"]
         self.assertEqual(transitions, 1, text)
-        # The sink told its state and the profiler its cycles: two accounts of one time.
-        self.assertAlmostEqual(residency, seconds, delta=0.05 * seconds, msg=text)
+        # The sink told its state and the profiler its cycles: two accounts of one time, apart from
+        # cycles that a busy machine missed.
+        self.assertGreaterEqual(residency, 0.95 * seconds, text)
+        self.assertLessEqual(residency, 1.05 * longest, text)
         total = sum(state[1] for state in states.values())
         self.assertAlmostEqual(duty, residency / total, delta=0.01, msg=text)
         self.assertAlmostEqual(sum(state[2] for state in states.values()), 1, delta=0.01, msg=text)
@@ -169,30 +175,32 @@ class DriverStatisticsTest(unittest.TestCase):
         self.play(30)
         self.wait_for_sink("running")
         wait_for("the thread to come to rest", lambda: self.wake_ups_during(0.5) == 0)
-        self.assertEqual(self.wake_ups_during(3 * BATCH), 0)
+        self.assertEqual(self.wake_ups_during(2 * BATCH), 0)
 
         self.start_session(1)
         wait_for("cycles to be told", lambda: self.wake_ups_during(3 * BATCH) >= 2)
         self.end_session(1)
         wait_for("the thread to come to rest again", lambda: self.wake_ups_during(0.5) == 0)
-        self.assertEqual(self.wake_ups_during(3 * BATCH), 0)
+        self.assertEqual(self.wake_ups_during(2 * BATCH), 0)
         self.assertEqual(self.sink_state(), "running")
 
-    def test_two_sessions_at_once_count_what_each_spans(self):
-        self.start_session(1)
-        first = self.play(1)
-        self.assertEqual(first.wait(30), 0)
-        self.wait_until_all_is_told()
-        self.start_session(2)
-        second = self.play(2)
-        self.assertEqual(second.wait(30), 0)
-        self.wait_until_all_is_told()
-        self.end_session(2)
-        of_second = self.wait_for_statistics("Simple")[SINK + "Simple_cycles"]
-        self.end_session(1)
-        of_first = self.wait_for_statistics("Simple", 2)[SINK + "Simple_cycles"]
+    def test_sessions_at_once_count_what_each_spans(self):
+        def play_during(session):
+            self.start_session(session)
+            self.assertEqual(self.play(1).wait(30), 0)
+            self.wait_until_all_is_told()
+            self.end_session(session)
+            return self.wait_for_statistics("Simple", session)[SINK + "Simple_cycles"]
 
-        self.assertAlmostEqual(of_first / of_second, 1.5, delta=0.25)
+        self.start_session(3)
+        first = play_during(1)
+        second = play_during(2)
+        self.end_session(3)
+        both = self.wait_for_statistics("Simple", 3)[SINK + "Simple_cycles"]
+
+        # However long the playbacks took here.
+        self.assertGreater(min(first, second), 0)
+        self.assertEqual(both, first + second)
 
     def test_a_pipewire_that_restarts_is_found_again_and_counted(self):
         self.start_session(1)
