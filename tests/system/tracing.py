@@ -171,3 +171,12 @@ def children_of(pid):
             name, rest = stat.read_text().split("(", 1)[1].rsplit(")", 1)
             if int(rest.split()[1]) == pid:
                 yield int(stat.parent.name), name
+
+
+def waits_for_processor(pid):
+    """How many seconds each thread of a process was ready to run, but others did."""
+    waits = {}
+    for file in Path(f"/proc/{pid}/task").glob("*/schedstat"):
+        with contextlib.suppress(FileNotFoundError, ProcessLookupError):
+            waits[file.parent.name] = int(file.read_text().split()[1]) / 1e9
+    return waits
