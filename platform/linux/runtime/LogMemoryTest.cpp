@@ -63,6 +63,15 @@ TEST(LogMemoryTest, KeepsOnlyTheNewestLines) {
   EXPECT_EQ(memory.contents().added, 5U);
 }
 
+TEST(LogMemoryTest, KeepsTenThousandLinesUnlessToldOtherwise) {
+  LogMemory memory(LogLevel::kInfo);
+  const std::string line(200, 'a');
+
+  for (int count = 0; count < 10'001; ++count) add(memory, line);
+
+  EXPECT_EQ(memory.contents().lines, 10'000U);
+}
+
 TEST(LogMemoryTest, OldestLinesMakeRoomWhenTheBytesAreUsedUp) {
   LogMemory memory(LogLevel::kInfo, {.lines = 100, .bytes = 10});
 
