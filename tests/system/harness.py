@@ -185,6 +185,9 @@ class Service:
                 return int(line.split()[1])
         raise AssertionError("the service is gone")
 
+    def threads(self):
+        return len(os.listdir(f"/proc/{self.process.pid}/task"))
+
     def voluntary_switches(self):
         """How often the threads of the service went to sleep so far: each is one wake-up."""
         total = 0

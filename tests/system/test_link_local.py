@@ -5,12 +5,14 @@ import os
 import shutil
 import subprocess
 import tempfile
+import time
 import unittest
 
 import harness
 from harness import Service, wait_for
 
 MESSAGES = 500
+SINGLE_MESSAGES = 3000
 
 
 def link_messages(service, *arguments):
@@ -53,6 +55,22 @@ class LinkLocal(unittest.TestCase):
         self.assertTrue(messages[0]["service_name"].endswith("_session"))
         times = [message["time"] for message in messages]
         self.assertEqual(times, sorted(times))
+
+    def test_thousands_of_messages_before_the_start_go_out_singly_without_a_thread_each(self):
+        with Service() as service:
+            client = service.client()
+            self.addCleanup(client.close)
+            client.create(7)
+            threads = service.threads()
+            begun = time.time()
+            for number in range(SINGLE_MESSAGES):
+                client.send({"number": number}, reporters=[7])
+            self.assertLessEqual(service.threads(), threads)
+            messages = wait_for("all single messages", pause=0.1, condition=lambda: len(
+                found := link_messages(service, "--session=-1")) == SINGLE_MESSAGES and found)
+
+        self.assertEqual(sorted(numbers_of(messages)), list(range(SINGLE_MESSAGES)))
+        self.assertGreaterEqual(min(message["time"] for message in messages) - begun, 1)
 
     def test_end_of_the_service_loses_nothing(self):
         directory = tempfile.mkdtemp(prefix="halvox-test-")
