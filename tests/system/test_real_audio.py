@@ -38,12 +38,18 @@ class RealAudioTest(unittest.TestCase):
                 for payload in message(self.service.events(), "Volume.State")]
 
     def test_playback_is_recorded_under_both_names_with_its_volumes(self):
-        player = self.play(1.5, volume=0.5, role="Music")
+        # Long enough for all that is done meanwhile; it is stopped when that is done.
+        began = time.monotonic()
+        player = self.play(60, volume=0.5, role="Music")
         self.wait_for_message("Volume.State")
+        seen = time.monotonic()
         control = self.audio.run("pw-cli", "s", "pw-play", "Props", "{ volume: 0.25 }")
         self.assertEqual(control.wait(30), 0)
-        self.assertEqual(player.wait(30), 0)
+        self.wait_for_message("Volume.State", 2)
+        least = time.monotonic() - seen
+        stop_process(player)
         stop = self.wait_for_message("Session_Playback.Stop")[0]
+        most = time.monotonic() - began
 
         self.assertEqual(self.volumes(), [(0.5, 1), (0.25, 1), (0.25, 0)])
         names = [name for name, _ in self.service.events()]
@@ -51,7 +57,7 @@ class RealAudioTest(unittest.TestCase):
                           for name in names[::2]], names[1::2])
         start = message(self.service.events(), "Session_Playback.Start")[0]
         played = stop["hvreporting_timestamp"] - start["hvreporting_timestamp"]
-        self.assertAlmostEqual(played, 1.5, delta=1.0)
+        self.assertTrue(least <= played <= most, (least, played, most))
         self.assertEqual(start["HostApplicationDisplayID"], "pw-play")
         route = message(self.service.events(), "RouteChange.State")[0]
         self.assertEqual(route["active_devices"], "Demo speakers")
@@ -115,7 +121,7 @@ class RealAudioTest(unittest.TestCase):
         self.wait_for_message("Volume.State")
         wait_for("the reporter to come to rest", lambda: self.wake_ups(seconds=0.5) == 0)
 
-        self.assertEqual(self.wake_ups(seconds=3), 0)
+        self.assertEqual(self.wake_ups(seconds=2), 0)
 
     def test_what_a_stalled_player_missed_is_recorded_as_an_issue(self):
         player = self.play(30)
