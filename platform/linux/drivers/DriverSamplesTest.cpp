@@ -90,6 +90,14 @@ TEST(DriverSamplesTest, StatesAreSubtractedAndTheDutyCycleIsThatOfTheTimeBetween
   EXPECT_THAT(dutyCycles, ElementsAre(0.75, 0.25));
 }
 
+TEST(DriverSamplesTest, AStateChannelThatBeganAnewCountsFromZeroAsAWhole) {
+  const auto channel = stateChannel({"on", "off"});
+
+  EXPECT_THAT(
+      deltaOf(makeReading({channel}, {5, 900, 4, 800}), makeReading({channel}, {6, 1000, 0, 30})),
+      ElementsAre("-/-/-/-  = on:6:1000 off:0:30"));
+}
+
 TEST(DriverSamplesTest, HitsAreSubtractedAndMinimumAndMaximumAreThoseOfTheLaterSample) {
   const auto channel = histogramChannel({{0, 10}, {10, 20}});
 

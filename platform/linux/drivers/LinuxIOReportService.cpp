@@ -61,11 +61,12 @@ class GroupChannels final : public IOReportChannels {
 class GroupSubscription final : public IOReportSubscription {};
 
 std::shared_ptr<const DriverSamples> sample(
-    const std::vector<std::unique_ptr<SourceReader>>& readers, GroupSelection& group) {
+    const std::vector<std::unique_ptr<SourceReader>>& readers,
+    std::chrono::milliseconds longestWait, GroupSelection& group) {
   std::vector<SourceReader::Asked> asked;
   asked.reserve(readers.size());
   for (const auto& reader : readers) asked.push_back(reader->ask());
-  const auto deadline = SourceReader::Clock::now() + SourceReader::kLongestWait;
+  const auto deadline = SourceReader::Clock::now() + longestWait;
   std::vector<DriverSamples::Part> parts;
   DriverSamples::Sources late;
   for (std::size_t source = 0; source < readers.size(); ++source) {
@@ -87,9 +88,11 @@ const DriverSamples& samplesOf(const IOReportService::Samples& samples) {
 }  // namespace
 
 LinuxIOReportService::LinuxIOReportService(std::vector<std::unique_ptr<DriverSource>> sources,
-                                           StatisticsService& statistics) {
+                                           StatisticsService& statistics,
+                                           std::chrono::milliseconds longestWait)
+    : longestWait_(longestWait) {
   for (auto& source : sources) {
-    readers_.push_back(std::make_unique<SourceReader>(std::move(source), statistics));
+    readers_.push_back(std::make_unique<SourceReader>(std::move(source), statistics, longestWait));
   }
 }
 
@@ -104,7 +107,7 @@ IOReportService::Channels LinuxIOReportService::IOReportCopyChannelsInGroup(
     Name group, Name subGroup, std::optional<IOReportError>& /*error*/) {
   auto selection = std::make_shared<GroupSelection>(group, subGroup, readers_.size());
   std::size_t count = 0;
-  const auto samples = sample(readers_, *selection);
+  const auto samples = sample(readers_, longestWait_, *selection);
   for (const auto& part : samples->parts()) count += part.selection->size();
   return std::make_shared<GroupChannels>(std::move(selection), static_cast<std::int32_t>(count));
 }
@@ -123,7 +126,7 @@ IOReportService::Subscription LinuxIOReportService::IOReportCreateSubscription(
 IOReportService::Samples LinuxIOReportService::IOReportCreateSamples(
     const Subscription& /*subscription*/, const Channels& channels,
     std::optional<IOReportError>& /*error*/) {
-  return sample(readers_, *static_cast<const GroupChannels&>(*channels).selection);
+  return sample(readers_, longestWait_, *static_cast<const GroupChannels&>(*channels).selection);
 }
 
 IOReportService::Samples LinuxIOReportService::IOReportCreateSamplesDelta(

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <memory>
 #include <vector>
 
@@ -12,14 +13,15 @@ namespace halvox::platform::linux_ {
 
 // What the kernel, the sound server and other daemons count, as driver channels. A subscription is
 // to a group, not to the channels that are there when it is made: channels that appear later count
-// from zero. No reading holds the caller longer than SourceReader::kLongestWait, all sources
-// together; what is late is left out.
+// from zero. No reading holds the caller longer than the longest wait, all sources together; what
+// is late is left out.
 //
 // Any thread may call. Owns the sources and their threads, which sleep while nobody asks.
 class LinuxIOReportService final : public IOReportService {
  public:
   LinuxIOReportService(std::vector<std::unique_ptr<DriverSource>> sources,
-                       StatisticsService& statistics);
+                       StatisticsService& statistics,
+                       std::chrono::milliseconds longestWait = SourceReader::kLongestWait);
   ~LinuxIOReportService() override;
 
   // Starts the threads, which open all sources at once, and waits until each has, or has taken too
@@ -38,6 +40,7 @@ class LinuxIOReportService final : public IOReportService {
   void IOReportIterate(const Samples& samples, const Visitor& visitor) const override;
 
  private:
+  const std::chrono::milliseconds longestWait_;
   std::vector<std::unique_ptr<SourceReader>> readers_;
 };
 

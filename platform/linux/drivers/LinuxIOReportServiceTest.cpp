@@ -50,7 +50,8 @@ class LinuxIOReportServiceTest : public ::testing::Test {
     std::vector<std::unique_ptr<DriverSource>> sources;
     sources.push_back(std::make_unique<MadeSource>(std::move(make)));
     if (other) sources.push_back(std::make_unique<MadeSource>(std::move(other)));
-    service_ = std::make_unique<LinuxIOReportService>(std::move(sources), platform_.statistics);
+    service_ = std::make_unique<LinuxIOReportService>(std::move(sources), platform_.statistics,
+                                                      longestWait_);
     service_->open();
     return *service_;
   }
@@ -76,6 +77,9 @@ class LinuxIOReportServiceTest : public ::testing::Test {
 
   FakePlatform platform_;
   Gate gate_;
+  // Before serve(): as long as no busy machine makes a reading late, unless the test wants it to
+  // be.
+  std::chrono::milliseconds longestWait_ = 10s;
   std::unique_ptr<LinuxIOReportService> service_;
 };
 
@@ -154,6 +158,7 @@ TEST_F(LinuxIOReportServiceTest, GroupsThatAreSampledOneAfterTheOtherShareOneRea
 }
 
 TEST_F(LinuxIOReportServiceTest, ASlowSourceIsLeftOutAndTheOthersAreNot) {
+  longestWait_ = 200ms;
   const auto slow = simpleChannel("Tx", "slow");
   const auto fast = simpleChannel("Tx", "fast");
   serve(
@@ -173,6 +178,7 @@ TEST_F(LinuxIOReportServiceTest, ASlowSourceIsLeftOutAndTheOthersAreNot) {
 }
 
 TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndTheLogTellsItOnce) {
+  longestWait_ = SourceReader::kLongestWait;
   serve([&] {
     gate_.pass();
     return makeReading({simpleChannel("Tx", "a")}, {1});
@@ -194,6 +200,7 @@ TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndTheLogTellsItO
 }
 
 TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
+  longestWait_ = 200ms;
   serve([&] {
     gate_.pass();
     return makeReading({simpleChannel("Tx", "a")}, {1});
@@ -212,6 +219,7 @@ TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
 
 // It counted since its driver was loaded, not since the session began.
 TEST_F(LinuxIOReportServiceTest, WhatASourceThatWasLateAtTheSnapshotCountedIsNotReported) {
+  longestWait_ = 200ms;
   const auto channel = simpleChannel("Tx", "a");
   auto& service = serve([&] {
     gate_.pass();
@@ -282,6 +290,7 @@ TEST_F(LinuxIOReportServiceTest, TheLeaseIsReleasedWhenNobodyHoldsSamples) {
 }
 
 TEST_F(LinuxIOReportServiceTest, ReadingsAskedForAreGivenOrLate) {
+  longestWait_ = 200ms;
   serve([&] {
     gate_.pass();
     return makeReading({}, {});

@@ -17,8 +17,10 @@ std::string pieceOf(const DriverSource& source) {
 }  // namespace
 
 // asked for = given + left out.
-SourceReader::SourceReader(std::unique_ptr<DriverSource> source, StatisticsService& statistics)
+SourceReader::SourceReader(std::unique_ptr<DriverSource> source, StatisticsService& statistics,
+                           std::chrono::milliseconds longestWait)
     : source_(std::move(source)),
+      longestWait_(longestWait),
       received_(statistics.counter(pieceOf(*source_), "readings asked for")),
       given_(statistics.counter(pieceOf(*source_), "readings given")),
       late_(statistics.counter(pieceOf(*source_), "left out: late")) {}
@@ -66,7 +68,7 @@ std::shared_ptr<const Reading> SourceReader::take(Asked asked, Clock::time_point
   (reading == nullptr ? late_ : given_).add();
   if (isFirstLate) {
     kLog.error("the driver counters of ", source_->name(), " did not come within ",
-               kLongestWait.count(), " ms and are left out until they do");
+               longestWait_.count(), " ms and are left out until they do");
   }
   return reading;
 }
@@ -117,7 +119,7 @@ void SourceReader::run() {
     ReadingPointer reading = source_->read();
     const Clock::time_point now = Clock::now();
     mutex_.lock();
-    if (now - start <= kLongestWait) isLate_ = false;
+    if (now - start <= longestWait_) isLate_ = false;
     isWanted_ = false;
     ++numberMade_;
     newestTime_ = now;

@@ -24,7 +24,9 @@ class SourceReader {
   static constexpr std::chrono::milliseconds kLongestWait{50};
   static constexpr std::chrono::milliseconds kLongestOpening{1000};
 
-  SourceReader(std::unique_ptr<DriverSource> source, StatisticsService& statistics);
+  // `longestWait` is the time that a reading may take.
+  SourceReader(std::unique_ptr<DriverSource> source, StatisticsService& statistics,
+               std::chrono::milliseconds longestWait = kLongestWait);
   SourceReader(const SourceReader&) = delete;
   SourceReader& operator=(const SourceReader&) = delete;
   ~SourceReader();
@@ -56,6 +58,7 @@ class SourceReader {
       HALVOX_REQUIRES(mutex_);
 
   const std::unique_ptr<DriverSource> source_;
+  const std::chrono::milliseconds longestWait_;
   Counter& received_;
   Counter& given_;
   Counter& late_;
