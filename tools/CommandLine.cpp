@@ -78,7 +78,7 @@ void nameThings(CLI::App& app) {
   formatter->label("SUBCOMMAND", "COMMAND");
   formatter->label("Positionals", "Arguments");
   formatter->label("REQUIRED", "(required)");
-  formatter->label("Excludes", "(not with)");
+  formatter->label("Excludes", "not with");
   app.formatter(formatter);
 }
 
@@ -140,19 +140,25 @@ std::string listCommands(const CLI::App& app) {
   return list;
 }
 
+// What is wrong, in our words where the library's would not help.
+std::string reasonOf(const CLI::ParseError& error, const CLI::App& app, const CLI::App& command) {
+  const bool isWithoutCommand = dynamic_cast<const CLI::RequiredError*>(&error) != nullptr &&
+                                command.get_require_subcommand_min() > 0 &&
+                                command.get_subcommands().empty();
+  if (!isWithoutCommand) return harmlessText(error.what());
+  const auto rest = app.remaining(true);
+  const std::string what = rest.empty()
+                               ? "a command is missing"
+                               : "there is no command \"" + harmlessText(rest.front()) + "\"";
+  return what + "; expected " + listCommands(command);
+}
+
 // "halvoxctl send: --type: …": which command, which argument, what is wrong with it.
 std::string describe(const CLI::ParseError& error, const CLI::App& app, CommandSource source) {
   const auto chosen = chosenOf(app);
-  const auto rest = app.remaining();
   const std::string prefix = nameOf(app, chosen);
   std::string text = prefix.empty() ? "" : prefix + ": ";
-  if (chosen.empty() && !rest.empty()) {
-    text +=
-        "there is no command \"" + harmlessText(rest.front()) + "\"; expected " + listCommands(app);
-  } else {
-    text += harmlessText(error.what());
-  }
-  text += '\n';
+  text += reasonOf(error, app, chosen.empty() ? app : *chosen.back()) + '\n';
   if (source == CommandSource::kArguments) text += "Try '" + prefix + " --help'.\n";
   return text;
 }

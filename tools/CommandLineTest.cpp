@@ -240,6 +240,16 @@ TEST(CommandLineTest, AnUnknownCommandIsAnsweredWithTheKnownOnes) {
   EXPECT_NE(error.find("events"), std::string::npos);
 }
 
+TEST(CommandLineTest, ACommandThatIsMissingOrUnknownIsAnsweredWithThoseOfItsPlace) {
+  EXPECT_EQ(errorOf({}).substr(0, 56), "halvoxctl: a command is missing; expected create, set-ty");
+  EXPECT_EQ(errorOf({"trace"}),
+            "halvoxctl trace: a command is missing; expected record, show, export");
+  EXPECT_EQ(errorOf({"trace", "throw"}),
+            "halvoxctl trace: there is no command \"throw\"; expected record, show, export");
+  EXPECT_EQ(errorOf({"--socket"}).substr(0, 20), "halvoxctl: --socket:");
+  EXPECT_NE(errorOf({"--timeout", "x", "trace"}).find("--timeout:"), std::string::npos);
+}
+
 TEST(CommandLineTest, ArgumentsTooManyAreRefused) {
   EXPECT_NE(errorOf({"create", "7", "8"}), "");
   EXPECT_NE(errorOf({"list", "--nonsense"}), "");

@@ -67,7 +67,7 @@ CLI::Option* addOptionalSeconds(CLI::App& app, const std::string& name,
           },
           description)
       ->expected(0, 1)
-      ->type_name("SECONDS");
+      ->type_name("[SECONDS]");
 }
 
 }  // namespace halvox::tools
