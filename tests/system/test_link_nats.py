@@ -269,7 +269,7 @@ class FailureTest(NatsTest):
             driver.start(1)
             driver.found(1)
             server.kill()
-            taken, refused, error = driver.send(1, 150_000)
+            taken, refused, error = driver.send(1, 80_000)
             seconds = driver.flush(1)
             counters = driver.end()
 
