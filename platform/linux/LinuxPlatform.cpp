@@ -218,7 +218,7 @@ bool LinuxPlatform::close() {
   notify_.stop();  // it adds jobs to queues
   traces_->stop();
   const bool ended = dispatch_.stop(kJobsEndWithin);
-  if (ended) traces_->close();
+  ended ? traces_->close() : traces_->abandon();
   const bool linkEnded = !nats_ || nats_->close();
   store_.close();
   logStatistics(LogLevel::kInfo, Counters::kCounted);

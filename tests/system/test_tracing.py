@@ -187,21 +187,28 @@ class KernelTraceTest(unittest.TestCase):
             service.stop()
             self.assertFalse(is_running(daemon))
 
-    def test_service_that_ends_while_it_reads_counts_every_event(self):
-        events = 100_000
+    def test_service_that_ends_while_it_reads_stops_reading_and_counts_every_event(self):
+        events = 300_000
         with TracedService() as service:
             client = start_session(service)
-            service.run_client("flood", events, 200_000)
+            service.run_client("flood", events, 1_000_000_000)
             client.call_later("stopReportingSessionForID", "x", REPORTER)
             wait_for("the stop", lambda: "Tearing down trace" in service.log())
+            daemon = service.daemon()
             service.stop()
             client.close()
+
+            # The stop still waits for its results, but the tracer is left as it was found.
+            self.assertFalse(is_running(daemon))
+            self.assertEqual(service.scratch(), [])
 
             counts = dict(re.findall(r"counted kernel traces, (.*): (\d+)", service.log()))
             read = int(counts.get("events read back", 0))
             handled = sum(int(counts.get(name, 0)) for name in
                           ("events delivered", "events dropped: the service ends"))
             self.assertEqual(handled, read)
+            # Otherwise the end of the service would take as long as the reading of its traces.
+            self.assertLess(read + int(counts.get("events lost by the tracer", 0)), events)
 
     def test_without_the_feature_nothing_is_traced(self):
         with TracedService(switch="false") as service:

@@ -80,6 +80,7 @@ class NoTraceServices final : public TraceServices {
   void open() override {}
   void stop() override {}
   void close() override {}
+  void abandon() override {}
   [[nodiscard]] std::string description() const override { return "none, LTTng not in this build"; }
 
  private:

@@ -12,7 +12,7 @@ namespace halvox::platform::linux_ {
 
 // What records traces. Made before the other services are installed, opened when they are.
 //
-//   made --open()--> serving --stop()--> declining --close()--> closed
+//   made --open()--> serving --stop()--> declining --close() or abandon()--> closed
 class TraceServices {
  public:
   virtual ~TraceServices() = default;
@@ -26,6 +26,9 @@ class TraceServices {
   virtual void stop() = 0;
   // Leaves nothing of ours in the tracer. After the queues have ended.
   virtual void close() = 0;
+  // The same when a queue would not end, such as that of a stop that waits for its trace. May wait
+  // for what is just being asked of the tracer.
+  virtual void abandon() = 0;
   // In words, for the log.
   [[nodiscard]] virtual std::string description() const = 0;
 };

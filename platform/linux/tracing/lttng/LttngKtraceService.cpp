@@ -195,18 +195,20 @@ void LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
   auto batch = std::make_shared<Batch>(dropped_);
   const auto deliver = [&] {
     auto full = std::exchange(batch, std::make_shared<Batch>(dropped_));
-    if (full->size() == 0 || !gate_.enter()) return;
+    if (full->size() == 0) return true;
+    if (!gate_.enter()) return false;
     session->queue->async(JobWeight::kMayBlock, [this, session, full = std::move(full)] {
       const std::vector<trace_point> points = full->take();
       delivered_.add(points.size());
       session->deliver(points);
       gate_.leave();
     });
+    return true;
   };
   const auto take = [&](trace_point point) {
     if (!session->hasWalltimes) point.walltime = 0;
     batch->add(point);
-    if (batch->size() == kBatchEvents) deliver();
+    return batch->size() < kBatchEvents || deliver();
   };
   const TraceReading reading = readTraces(
       session->recording->directory,

@@ -22,6 +22,7 @@ class LttngTraceServices final : public TraceServices {
     ktrace_.close();
     performanceTraces_.close();
   }
+  void abandon() override { control_.close(); }
   [[nodiscard]] std::string description() const override { return "LTTng"; }
 
  private:

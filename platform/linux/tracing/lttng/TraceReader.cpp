@@ -76,11 +76,13 @@ class Sink {
     std::uint64_t count = 0;
     const auto status = bt_message_iterator_next(iterator, &messages, &count);
     if (status != BT_MESSAGE_ITERATOR_NEXT_STATUS_OK) return static_cast<Status>(status);
+    auto& self = *static_cast<Sink*>(sink);
     for (std::uint64_t index = 0; index < count; ++index) {
-      static_cast<Sink*>(sink)->take(messages[index]);
+      if (self.wantsMore_) self.take(messages[index]);
       bt_message_put_ref(messages[index]);
     }
-    return BT_GRAPH_SIMPLE_SINK_COMPONENT_CONSUME_FUNC_STATUS_OK;
+    return self.wantsMore_ ? BT_GRAPH_SIMPLE_SINK_COMPONENT_CONSUME_FUNC_STATUS_OK
+                           : BT_GRAPH_SIMPLE_SINK_COMPONENT_CONSUME_FUNC_STATUS_END;
   }
 
  private:
@@ -106,7 +108,7 @@ class Sink {
       point.walltime = static_cast<double>(sinceOrigin) / double{kNanosecondsPerSecond};
     }
     ++reading_.events;
-    listener_.onEvent(point);
+    wantsMore_ = listener_.onEvent(point);
   }
 
   void takeClock(const bt_clock_class* clock) {
@@ -138,6 +140,7 @@ class Sink {
   const TraceListener& listener_;
   TraceReading& reading_;
   bool hasClock_ = false;
+  bool wantsMore_ = true;
 };
 
 // What the library says about its latest failure, which it then forgets.

@@ -30,8 +30,8 @@ struct TraceReading {
 
 // Hears what a trace holds, on the thread that reads it.
 struct TraceListener {
-  std::function<void(const TraceClock&)> onClock;  // at most once, before the first event
-  std::function<void(const trace_point&)> onEvent;
+  std::function<void(const TraceClock&)> onClock;   // at most once, before the first event
+  std::function<bool(const trace_point&)> onEvent;  // false: no more is wanted
 };
 
 // Reads all "halvox:kdebug" events of the traces below a directory, in the order of their times.
