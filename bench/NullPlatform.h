@@ -228,4 +228,10 @@ struct NullPlatform {
   MapStatistics statistics;
 };
 
+// The one of the program; logs errors only, as nobody reads the log of a benchmark.
+inline NullPlatform& nullPlatform() {
+  static auto* instance = new NullPlatform(platform::LogLevel::kError);
+  return *instance;
+}
+
 }  // namespace halvox::bench

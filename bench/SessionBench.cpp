@@ -5,6 +5,7 @@
 #include <benchmark/benchmark.h>
 
 #include "bench/NullPlatform.h"
+#include "bench/TypicalMessage.h"
 #include "service/HVReportingClientServerInstance.h"
 #include "service/HVReportingServiceDelegate.h"
 #include "session/HVReportingSession.h"
@@ -16,32 +17,11 @@
 namespace halvox {
 namespace {
 
+using bench::makeMessage;
+using bench::nullPlatform;
 using platform::Dictionary;
 
 constexpr std::int64_t kBatch = 10'000;
-
-bench::NullPlatform& nullPlatform() {
-  // Errors only, as nobody reads the log of a benchmark.
-  static auto* instance = new bench::NullPlatform(platform::LogLevel::kError);
-  return *instance;
-}
-
-// Ten fields, as audio frameworks send them; the number makes it differ from all others.
-Dictionary makeMessage(std::int64_t number) {
-  Dictionary message;
-  message.reserve(10);
-  message.set("frame_counter", number);
-  message.set("sample_rate", 48000.0);
-  message.set("channels", std::int32_t{2});
-  message.set("io_buffer_frames", std::int32_t{512});
-  message.set("is_running", true);
-  message.set("volume", 0.75);
-  message.set("route", "Speaker");
-  message.set("format", "lpcm/float32");
-  message.set("device_uid", "alsa_output.pci-0000_00_1f.3.analog-stereo");
-  message.set("latency_ms", 10.67);
-  return message;
-}
 
 std::vector<Dictionary> makeMessages(std::int64_t first) {
   std::vector<Dictionary> messages;

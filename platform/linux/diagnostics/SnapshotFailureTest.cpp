@@ -1,10 +1,8 @@
-#include <csignal>
-
 #include <sched.h>
 #include <sys/mount.h>
-#include <sys/resource.h>
 
 #include "platform/linux/diagnostics/SnapshotTestSupport.h"
+#include "platform/linux/testing/FileSizeLimit.h"
 
 // How snapshots bear a disk that does not take them.
 
@@ -41,26 +39,6 @@ class SnapshotFailureTest : public SnapshotTest {
   void expectSuccess() {
     EXPECT_THAT(archiveFiles(textOf(snapshot(), "path")), SizeIs(testing::Ge(4U)));
   }
-};
-
-// Lets files of this process grow to so many bytes and no further, as a full disk would.
-class FileSizeLimit {
- public:
-  explicit FileSizeLimit(rlim_t bytes) : oldAction_(std::signal(SIGXFSZ, SIG_IGN)) {
-    ::getrlimit(RLIMIT_FSIZE, &old_);
-    const rlimit limit{bytes, old_.rlim_max};
-    ::setrlimit(RLIMIT_FSIZE, &limit);
-  }
-  FileSizeLimit(const FileSizeLimit&) = delete;
-  FileSizeLimit& operator=(const FileSizeLimit&) = delete;
-  ~FileSizeLimit() {
-    ::setrlimit(RLIMIT_FSIZE, &old_);
-    std::signal(SIGXFSZ, oldAction_);
-  }
-
- private:
-  sighandler_t oldAction_;
-  rlimit old_{};
 };
 
 class SmallDisk {

@@ -1,9 +1,7 @@
-#include <csignal>
 #include <string>
 
-#include <sys/resource.h>
-
 #include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/testing/FileSizeLimit.h"
 
 // How the store bears what happens to its file while it runs.
 
@@ -43,26 +41,6 @@ class SqliteStoreFailureTest : public StoreTest {
     EXPECT_EQ(counted("received"), counted("stored") + dropped());
     EXPECT_THAT(payloads(), SizeIs(counted("stored")));
   }
-};
-
-// Lets files of this process grow to so many bytes and no further, as a full disk would.
-class FileSizeLimit {
- public:
-  explicit FileSizeLimit(rlim_t bytes) : oldAction_(std::signal(SIGXFSZ, SIG_IGN)) {
-    ::getrlimit(RLIMIT_FSIZE, &old_);
-    const rlimit limit{bytes, old_.rlim_max};
-    ::setrlimit(RLIMIT_FSIZE, &limit);
-  }
-  FileSizeLimit(const FileSizeLimit&) = delete;
-  FileSizeLimit& operator=(const FileSizeLimit&) = delete;
-  ~FileSizeLimit() {
-    ::setrlimit(RLIMIT_FSIZE, &old_);
-    std::signal(SIGXFSZ, oldAction_);
-  }
-
- private:
-  sighandler_t oldAction_;
-  rlimit old_{};
 };
 
 TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileTheDiskIsFullThenStoresAgain) {
