@@ -88,7 +88,7 @@ std::string AlsaSource::nameFor(const std::string& folder, const std::string& na
   const bool isTaken = std::ranges::any_of(cardNames_, [&](const auto& other) {
     return other.first != folder && other.second.shown == name;
   });
-  const std::string shown = isTaken ? name + " " + std::to_string(number) : name;
+  std::string shown = isTaken ? name + " " + std::to_string(number) : name;
   cardNames_.insert_or_assign(folder, CardName{name, shown, round_});
   return shown;
 }
