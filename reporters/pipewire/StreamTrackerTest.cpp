@@ -6,61 +6,13 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "reporters/pipewire/RecordingReportingClient.h"
+#include "reporters/pipewire/StreamTrackerFixture.h"
 
 namespace halvox::pipewire_reporter {
 namespace {
 
 using testing::ElementsAre;
 using testing::IsEmpty;
-
-constexpr GlobalID kSpeakers = 10;
-constexpr GlobalID kHeadphones = 11;
-constexpr GlobalID kStream = 20;
-constexpr std::uint32_t kCookie = 0xABCD1234;
-constexpr std::uint64_t kSerial = 55;
-
-class StreamTrackerTest : public testing::Test {
- protected:
-  StreamTrackerTest() {
-    tracker.serverConnected(kCookie);
-    addDevice(kSpeakers, "speakers", "Speakers");
-    addDevice(kHeadphones, "headphones", "Headphones");
-  }
-
-  void addDevice(GlobalID id, const char* name, const char* description) {
-    tracker.nodeAdded({.id = id,
-                       .serial = id,
-                       .mediaClass = "Audio/Sink",
-                       .properties = {{"node.name", name}, {"node.description", description}}});
-  }
-  void addStream(const char* mediaClass = "Stream/Output/Audio", Properties properties = {}) {
-    properties.emplace("application.process.binary", "player");
-    tracker.nodeAdded({.id = kStream,
-                       .serial = kSerial,
-                       .mediaClass = mediaClass,
-                       .properties = std::move(properties)});
-  }
-  // A stream that runs at half volume.
-  void runStream() {
-    addStream();
-    setVolume(0.5F);
-    tracker.streamRunningChanged(kStream, true);
-    client.forget();
-  }
-  void setVolume(float volume) {
-    tracker.streamVolumeChanged(kStream, {.volume = volume, .channels = {{1, 1}}, .muted = false});
-  }
-  [[nodiscard]] double sentVolume() const {
-    return client.last("volume").find(kVolumeKey)->toDouble();
-  }
-  [[nodiscard]] bool sentPlaying() const {
-    return client.last("volume").find(kPlayingKey)->toBool();
-  }
-
-  RecordingReportingClient client;
-  StreamTracker tracker{client};
-};
 
 TEST(ReporterIDTest, HoldsNamespaceCookieAndSerial) {
   EXPECT_EQ(reporterIDFor(0xABCD1234, 0x55), 0x5057'1234'0000'0055);
@@ -416,89 +368,6 @@ TEST_F(StreamTrackerTest, FollowsABoundedNumberOfStreams) {
 
   EXPECT_EQ(tracker.streamCount(), StreamTracker::kMaxStreams);
   EXPECT_EQ(tracker.refusedStreams(), 5U);
-}
-
-// --- Xruns --------------------------------------------------------------------------------------
-
-class StreamTrackerXrunTest : public StreamTrackerTest {
- protected:
-  using Milliseconds = std::chrono::milliseconds;
-
-  StreamTrackerXrunTest() {
-    addStream("Stream/Output/Audio", {{"node.name", "music-out"}, {"application.name", "Player"}});
-    tracker.streamRunningChanged(kStream, true);
-    client.forget();
-  }
-  // A cycle of a quarter of a second that those nodes missed.
-  void cycle(Milliseconds time, const std::vector<GlobalID>& late) {
-    tracker.cycleEnded(time, XrunMeter::Seconds(0.25), late);
-  }
-  [[nodiscard]] double sentSilence() const {
-    return client.last("playback-issue").find(kSilenceKey)->toDouble();
-  }
-};
-
-TEST_F(StreamTrackerXrunTest, AMissedCycleIsReportedWithItsNodeApplicationAndLength) {
-  cycle(Milliseconds(1000), {kStream});
-
-  EXPECT_THAT(client.operations(), ElementsAre("playback-issue"));
-  EXPECT_EQ(client.last("playback-issue"), (platform::Dictionary{{kIssueTypeKey, "xrun"},
-                                                                 {kNodeKey, "music-out"},
-                                                                 {kIssueClientKey, "Player"},
-                                                                 {kSilenceKey, 0.25},
-                                                                 {kSerialKey, kSerial}}));
-}
-
-TEST_F(StreamTrackerXrunTest, CyclesThatOtherNodesMissedAreNoIssueOfAStream) {
-  cycle(Milliseconds(1000), {kSpeakers, 999});
-  cycle(Milliseconds(2000), {});
-
-  EXPECT_THAT(client.operations(), IsEmpty());
-}
-
-TEST_F(StreamTrackerXrunTest, FurtherOnesAreAddedUpToOneReportASecond) {
-  for (int time = 1000; time < 2000; time += 250) {
-    cycle(Milliseconds(time), {kStream});
-  }
-  EXPECT_THAT(client.operations(), ElementsAre("playback-issue"));
-
-  cycle(Milliseconds(2000), {});  // nobody missed this one: it brings what was held back
-
-  EXPECT_THAT(client.operations(), ElementsAre("playback-issue", "playback-issue"));
-  EXPECT_EQ(sentSilence(), 0.75);
-}
-
-TEST_F(StreamTrackerXrunTest, WhatWasHeldBackIsReportedBeforeTheRunEnds) {
-  cycle(Milliseconds(1000), {kStream});
-  cycle(Milliseconds(1250), {kStream});
-  client.forget();
-
-  tracker.nodeRemoved(kStream);
-
-  EXPECT_THAT(client.operations(),
-              ElementsAre("playback-issue", "playback-stop", "stop", "destroy"));
-  EXPECT_EQ(sentSilence(), 0.25);
-}
-
-TEST_F(StreamTrackerXrunTest, AStreamThatDoesNotRunMissesNothing) {
-  tracker.streamRunningChanged(kStream, false);
-  client.forget();
-
-  cycle(Milliseconds(1000), {kStream});
-  tracker.nodeRemoved(kStream);
-
-  EXPECT_THAT(client.operations(), ElementsAre("stop", "destroy"));
-}
-
-TEST_F(StreamTrackerXrunTest, RecordingStreamsReportUnderTheirCategory) {
-  tracker.nodeRemoved(kStream);
-  addStream("Stream/Input/Audio", {{"node.name", "in"}});
-  tracker.streamRunningChanged(kStream, true);
-  client.forget();
-
-  cycle(Milliseconds(1000), {kStream});
-
-  EXPECT_THAT(client.operations(), ElementsAre("record-issue"));
 }
 
 }  // namespace
