@@ -74,7 +74,7 @@ std::optional<PreferenceFileError> replace(const std::filesystem::path& file,
 // The file that a link stands for, be it there or not, so that the link stays.
 std::filesystem::path target(const std::filesystem::path& file) {
   std::error_code error;
-  const auto real = std::filesystem::canonical(file, error);
+  auto real = std::filesystem::canonical(file, error);
   if (!error) return real;
   if (error != std::errc::no_such_file_or_directory) return file;
   const auto linked = linkedFiles(std::filesystem::absolute(file, error));
