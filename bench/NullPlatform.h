@@ -8,12 +8,12 @@
 #include <utility>
 #include <vector>
 
+#include "bench/AbsentServices.h"
 #include "platform/analytics.h"
 #include "platform/clock.h"
 #include "platform/connection.h"
 #include "platform/device_properties.h"
 #include "platform/dispatch.h"
-#include "platform/fake/AbsentServices.h"
 #include "platform/feature_flags.h"
 #include "platform/kdebug.h"
 #include "platform/log.h"
@@ -205,24 +205,24 @@ struct NullPlatform {
   }
 
   NullAnalytics analytics;
-  platform::AbsentDiagnosticReporters diagnosticReporters;
-  platform::AbsentFiles files;
-  platform::AbsentMetrics metrics;
-  platform::AbsentNotify notify;
-  platform::AbsentPowerLog powerLog;
-  platform::AbsentPreferences preferences;
-  platform::AbsentTlmReporting tlmReporting;
+  AbsentDiagnosticReporters diagnosticReporters;
+  AbsentFiles files;
+  AbsentMetrics metrics;
+  AbsentNotify notify;
+  AbsentPowerLog powerLog;
+  AbsentPreferences preferences;
+  AbsentTlmReporting tlmReporting;
   SteppingClock clock;
   NullConnections connections;
   NullDeviceProperties deviceProperties;
   ListDispatch dispatch;
   NullFeatureFlags featureFlags;
   NullKdebug kdebug;
-  platform::AbsentIOReport ioReport;
-  platform::AbsentKtrace ktrace;
-  platform::AbsentPerformanceTraces performanceTraces;
-  platform::AbsentPropertyLists propertyLists;
-  platform::AbsentResultsFiles resultsFiles;
+  AbsentIOReport ioReport;
+  AbsentKtrace ktrace;
+  AbsentPerformanceTraces performanceTraces;
+  AbsentPropertyLists propertyLists;
+  AbsentResultsFiles resultsFiles;
   NullLog log;
   NullProcess process;
   MapStatistics statistics;

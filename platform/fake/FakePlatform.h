@@ -1,6 +1,5 @@
 #pragma once
 
-#include "platform/fake/AbsentServices.h"
 #include "platform/fake/FakeAnalyticsService.h"
 #include "platform/fake/FakeClockService.h"
 #include "platform/fake/FakeConnectionService.h"

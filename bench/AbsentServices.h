@@ -16,7 +16,41 @@
 #include "platform/results_file.h"
 #include "platform/tlm_reporting.h"
 
-namespace halvox::platform {
+namespace halvox::bench {
+
+using platform::AILDiagnosticReporter;
+using platform::Data;
+using platform::DiagnosticReporterService;
+using platform::Dictionary;
+using platform::DispatchQueue;
+using platform::Error;
+using platform::FileService;
+using platform::IOReportError;
+using platform::IOReportService;
+using platform::JsonArrayFile;
+using platform::KQTraceConfig;
+using platform::KQTraceSession;
+using platform::KQTraceSessionDelegate;
+using platform::KtraceService;
+using platform::KtraceSession;
+using platform::MetricService;
+using platform::NotifyService;
+using platform::NotifyStatus;
+using platform::NotifyToken;
+using platform::PerformanceTraceService;
+using platform::PowerLogService;
+using platform::PreferenceService;
+using platform::PropertyListService;
+using platform::ProtoBase;
+using platform::ResultsFileService;
+using platform::ssunit;
+using platform::Sswriter;
+using platform::TLMReportingMessage;
+using platform::TLMReportingOutcome;
+using platform::TLMReportingService;
+using platform::TLMReportingSession;
+using platform::TLMSecureHierarchyToken;
+using platform::Value;
 
 // Services of which there is nothing: what is given to them goes nowhere and nothing comes from
 // them.
@@ -198,4 +232,4 @@ class AbsentPerformanceTraces final : public PerformanceTraceService {
   }
 };
 
-}  // namespace halvox::platform
+}  // namespace halvox::bench
