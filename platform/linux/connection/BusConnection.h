@@ -49,7 +49,6 @@ class BusConnection final : private StreamOwner {
   void handleSignal(const dbus::Frame& frame);
   void handleAnswer(const dbus::Frame& frame);
   std::shared_ptr<BusSender> senderNamed(std::string_view name);
-  void askForProcess(const std::string& name);
   void lose(const std::string& why);
 
   ConnectionHost& host_;

@@ -9,7 +9,6 @@ inline constexpr std::string_view kFailed = "org.freedesktop.DBus.Error.Failed";
 inline constexpr std::string_view kInvalidArgs = "org.freedesktop.DBus.Error.InvalidArgs";
 inline constexpr std::string_view kLimitsExceeded = "org.freedesktop.DBus.Error.LimitsExceeded";
 inline constexpr std::string_view kNameHasNoOwner = "org.freedesktop.DBus.Error.NameHasNoOwner";
-inline constexpr std::string_view kPropertyReadOnly = "org.freedesktop.DBus.Error.PropertyReadOnly";
 inline constexpr std::string_view kServiceUnknown = "org.freedesktop.DBus.Error.ServiceUnknown";
 inline constexpr std::string_view kUnknownInterface = "org.freedesktop.DBus.Error.UnknownInterface";
 inline constexpr std::string_view kUnknownMethod = "org.freedesktop.DBus.Error.UnknownMethod";
