@@ -41,13 +41,14 @@ class ProfileDecoderTest : public testing::Test {
     spa_pod_frame frame{};
     spa_pod_builder_push_object(&builder_, &frame, SPA_TYPE_OBJECT_Profiler, 0);
     spa_pod_builder_prop(&builder_, SPA_PROFILER_info, 0);
-    spa_pod_builder_add_struct(&builder_, SPA_POD_Long(1), SPA_POD_Float(0.1F), SPA_POD_Float(0.1F),
-                               SPA_POD_Float(0.1F), SPA_POD_Int(cycle.xruns));
+    spa_pod_builder_add_struct(&builder_, SPA_POD_Long(std::int64_t{1}), SPA_POD_Float(0.1F),
+                               SPA_POD_Float(0.1F), SPA_POD_Float(0.1F), SPA_POD_Int(cycle.xruns));
     spa_pod_builder_prop(&builder_, SPA_PROFILER_clock, 0);
     spa_pod_builder_add_struct(&builder_, SPA_POD_Int(0), SPA_POD_Int(30), SPA_POD_String("clock"),
                                SPA_POD_Long(cycle.time), SPA_POD_Fraction(&cycle.rate),
-                               SPA_POD_Long(4711), SPA_POD_Long(cycle.duration), SPA_POD_Long(0),
-                               SPA_POD_Double(1.0), SPA_POD_Long(0));
+                               SPA_POD_Long(std::int64_t{4711}), SPA_POD_Long(cycle.duration),
+                               SPA_POD_Long(std::int64_t{0}), SPA_POD_Double(1.0),
+                               SPA_POD_Long(std::int64_t{0}));
     addNode(SPA_PROFILER_driverBlock, {30, 3});
     for (const Follower& follower : cycle.followers) {
       addNode(SPA_PROFILER_followerBlock, follower);
@@ -58,8 +59,8 @@ class ProfileDecoderTest : public testing::Test {
     const spa_fraction latency{1024, 48000};
     spa_pod_builder_prop(&builder_, key, 0);
     spa_pod_builder_add_struct(&builder_, SPA_POD_Int(node.id), SPA_POD_String("node"),
-                               SPA_POD_Long(10), SPA_POD_Long(20), SPA_POD_Long(node.awake),
-                               SPA_POD_Long(120),  //
+                               SPA_POD_Long(std::int64_t{10}), SPA_POD_Long(std::int64_t{20}),
+                               SPA_POD_Long(node.awake), SPA_POD_Long(std::int64_t{120}),  //
                                SPA_POD_Int(node.status), SPA_POD_Fraction(&latency));
   }
 
@@ -146,7 +147,7 @@ TEST_F(ProfileDecoderTest, BlocksOfOtherShapesAreLeftOut) {
   spa_pod_builder_int(&builder_, 1);
   spa_pod_builder_push_object(&builder_, &inner, SPA_TYPE_OBJECT_Profiler, 0);
   spa_pod_builder_prop(&builder_, SPA_PROFILER_clock, 0);
-  spa_pod_builder_add_struct(&builder_, SPA_POD_Int(0), SPA_POD_Long(1));
+  spa_pod_builder_add_struct(&builder_, SPA_POD_Int(0), SPA_POD_Long(std::int64_t{1}));
   spa_pod_builder_prop(&builder_, SPA_PROFILER_followerBlock, 0);
   spa_pod_builder_int(&builder_, 41);
   spa_pod_builder_pop(&builder_, &inner);

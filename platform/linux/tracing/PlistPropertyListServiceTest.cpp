@@ -51,7 +51,7 @@ class PlistPropertyListServiceTest : public testing::Test {
   }
 
   const std::filesystem::path scratch_ = makeScratch();
-  const PlistPropertyListService service_;
+  const PlistPropertyListService service_{};
   std::optional<Error> error_;
 };
 
