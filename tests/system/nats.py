@@ -79,6 +79,10 @@ class Server:
         self.process.kill()
         self.process.wait(DEADLINE)
 
+    def lose_files(self):
+        """The next start finds no streams."""
+        shutil.rmtree(self.directory / "store")
+
     def stop(self):
         if self.process is not None:
             stop_process(self.process)

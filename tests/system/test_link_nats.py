@@ -216,6 +216,23 @@ class FailureTest(NatsTest):
             self.assertEqual(driver.flushed(f"{SUBJECT}.1"), [(10, 0), (100, 0)])
             self.assertEqual(balance(counters), 0)
 
+    def test_a_stream_that_is_gone_when_its_server_comes_back_is_made_again(self):
+        with Server() as server, Driver(server.url) as driver:
+            driver.start(1)
+            driver.found(1)
+            driver.send(1, 10)
+            driver.flush(1)
+            server.kill()
+            server.lose_files()
+            driver.send(1, 100, 10)
+            server.start()
+            driver.wait_until_acknowledged(110)
+            records = read_stream(server.url)
+            counters = driver.end()
+
+            self.assertEqual(numbers_of(records, f"{SUBJECT}.1"), list(range(10, 110)))
+            self.assertEqual(balance(counters), 0)
+
     def test_messages_on_their_way_survive_the_end_of_their_server(self):
         with Server() as server, Driver(server.url) as driver:
             driver.start(1, count=2)

@@ -51,8 +51,10 @@ struct OutgoingMessage {
 // Holding, nothing is published. Then the oldest message that is not acknowledged is published
 // again; once a server confirms it, all others follow in order, and then new ones. The stream knows
 // a message that it has by its identifier, and confirms it without storing it twice. So the
-// messages of a session keep their order, also when the stream's leader is lost. A message that is
-// not confirmed within kAckTime of its first attempt is given up, and counted as not acknowledged.
+// messages of a session keep their order, also when the stream's leader is lost. When nobody takes
+// the oldest message, the stream may be gone, deleted or with its server's files: then it is made
+// again. A message that is not confirmed within kAckTime of its first attempt is given up, and
+// counted as not acknowledged.
 //
 // Only a stream whose leader changes in less time than a message takes to the server and back can
 // take a later message before one that it had no leader for.
@@ -72,6 +74,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   static constexpr std::chrono::seconds kConnectionEndTime{5};
   static constexpr std::chrono::seconds kAckTime{30};
   static constexpr std::chrono::milliseconds kResendPause{100};
+  static constexpr std::chrono::seconds kStreamCheckPause{2};
   static constexpr std::size_t kQueueBytes = 32U << 20U;
 
   NatsLink(Configuration::Link options, const NatsEnvironment& environment);
@@ -126,7 +129,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   std::vector<NatsMessage> takeSome() HALVOX_REQUIRES(mutex_);
   void publish(std::vector<NatsMessage> messages, std::chrono::milliseconds patience)
       HALVOX_EXCLUDES(mutex_);
-  void hold(std::span<NatsMessage> messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
+  void hold(std::span<NatsMessage> messages, natsStatus status) HALVOX_EXCLUDES(mutex_);
   void beginHolding(Time until) HALVOX_REQUIRES(mutex_);
   static void onAcknowledged(jsCtx* context, natsMsg* message, jsPubAck* ack, jsPubAckErr* error,
                              void* link);
@@ -145,6 +148,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   [[nodiscard]] natsStatus configure(natsOptions* options);
   [[nodiscard]] natsStatus secure(natsOptions* options);
   [[nodiscard]] std::string provideStream(jsCtx* context);
+  void provideStreamAgain() HALVOX_EXCLUDES(mutex_);
   void drain() HALVOX_EXCLUDES(mutex_);
   void dropConnection() HALVOX_EXCLUDES(mutex_);
   void onAvailable(natsConnection* connection) HALVOX_EXCLUDES(mutex_);
@@ -167,6 +171,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   bool isWindowFull_ HALVOX_GUARDED_BY(mutex_) = false;
   Flow flow_ HALVOX_GUARDED_BY(mutex_) = Flow::kFlowing;
   Time probeAt_ HALVOX_GUARDED_BY(mutex_){};  // while holding
+  bool isStreamInDoubt_ HALVOX_GUARDED_BY(mutex_) = false;
   std::optional<Time> closeBy_ HALVOX_GUARDED_BY(mutex_);
   Time leaveBy_ HALVOX_GUARDED_BY(mutex_){};  // when close() leaves the thread behind
   bool isConnecting_ HALVOX_GUARDED_BY(mutex_) = false;
@@ -186,6 +191,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
 
   // How long a message is published again; the thread's alone.
   std::chrono::nanoseconds ackTime_ = kAckTime;
+  Time nextStreamCheck_{};  // the thread's alone
   // Changed by the thread alone, under the lock; other threads only compare the connection.
   NatsConnection connection_;
   JetStreamContext context_;

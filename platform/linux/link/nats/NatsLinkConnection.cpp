@@ -146,9 +146,30 @@ std::string NatsLink::provideStream(jsCtx* context) {
   stream.Replicas = static_cast<std::int64_t>(options_.replicas);
   stream.Duplicates = kDuplicatesTime.count();
   status = js_AddStream(info.out(), context, &stream, nullptr, &code);
+  if (status == NATS_OK) kLog.notice("made the stream ", options_.stream);
   // Another service may have made it in the meantime.
   if (status == NATS_OK || code == JSStreamNameExistErr) return {};
   return "stream " + options_.stream + " cannot be made: " + describe(status);
+}
+
+// Nobody takes messages while the stream has no leader, but neither when there is none any more: it
+// was deleted, or its server lost its files.
+void NatsLink::provideStreamAgain() {
+  const Time now = std::chrono::steady_clock::now();
+  {
+    const MutexLock lock(mutex_);
+    if (!isStreamInDoubt_ || now < nextStreamCheck_) return;
+    isStreamInDoubt_ = false;
+  }
+  const std::string failure = provideStream(context_.get());
+  nextStreamCheck_ = std::chrono::steady_clock::now() + kStreamCheckPause;
+  if (failure.empty()) return;
+  std::optional<std::uint64_t> worthALine;
+  {
+    const MutexLock lock(mutex_);
+    worthALine = attemptLog_.note(1, now);
+  }
+  if (worthALine) kLog.error("no server of the link takes messages: ", failure);
 }
 
 // Why it failed; empty on success.
@@ -241,6 +262,7 @@ void NatsLink::dropConnection() {
     isLost_ = false;
     isWindowFull_ = false;
     flow_ = Flow::kFlowing;
+    isStreamInDoubt_ = false;
     maxPayload_ = 0;
     servers_ = Array();
     lost = pending_.takeAll();

@@ -70,6 +70,7 @@ void NatsLink::publishSome() {
 
 // Publishes the oldest message again, and nothing else until a server confirms it.
 void NatsLink::probe() {
+  provideStreamAgain();
   reclaim();
   std::vector<NatsMessage> messages;
   {
@@ -110,7 +111,7 @@ void NatsLink::publish(std::vector<NatsMessage> messages, std::chrono::milliseco
     if (status == NATS_OK) continue;
     messages[index].reset(raw);
     if (isTemporary(status)) {
-      return hold(std::span(messages).subspan(index), natsStatus_GetText(status));
+      return hold(std::span(messages).subspan(index), status);
     }
     const jsPubAckErr error{.Msg = key, .Err = status, .ErrCode = {}, .ErrText = nullptr};
     resolve(std::move(messages[index]), &error);
@@ -118,7 +119,7 @@ void NatsLink::publish(std::vector<NatsMessage> messages, std::chrono::milliseco
 }
 
 // Keeps messages whose attempt failed, and all later ones, for another attempt.
-void NatsLink::hold(std::span<NatsMessage> messages, std::string_view reason) {
+void NatsLink::hold(std::span<NatsMessage> messages, natsStatus status) {
   std::optional<std::uint64_t> worthALine;
   {
     const MutexLock lock(mutex_);
@@ -128,11 +129,13 @@ void NatsLink::hold(std::span<NatsMessage> messages, std::string_view reason) {
     }
     if (!isKnown || flow_ == Flow::kHolding) return;
     const Time now = std::chrono::steady_clock::now();
+    if (flow_ == Flow::kProbing && status == NATS_NO_RESPONDERS) isStreamInDoubt_ = true;
     beginHolding(now + kResendPause);
     worthALine = holdLog_.note(1, now);
     changed_.notifyAll();
   }
-  if (worthALine) kLog.notice("messages of the link wait to be published again: ", reason);
+  if (worthALine)
+    kLog.notice("messages of the link wait to be published again: ", natsStatus_GetText(status));
 }
 
 void NatsLink::beginHolding(Time until) {
@@ -154,7 +157,7 @@ void NatsLink::onAcknowledged(jsCtx*, natsMsg* message, jsPubAck*, jsPubAckErr* 
   NatsMessage owned(message);
   auto& self = *static_cast<NatsLink*>(link);
   if (error != nullptr && isTemporary(error->Err, error->ErrCode)) {
-    return self.hold(std::span(&owned, 1), natsStatus_GetText(error->Err));
+    return self.hold(std::span(&owned, 1), error->Err);
   }
   self.resolve(std::move(owned), error);
 }
