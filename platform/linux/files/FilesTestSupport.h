@@ -6,7 +6,6 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
-#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -14,23 +13,13 @@
 
 #include "platform/linux/files/RootedFileService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 
 // A service over a root of its own, which is not there yet.
 class FilesTest : public testing::Test {
  protected:
-  FilesTest() = default;
-  ~FilesTest() override {
-    std::error_code ignored;
-    std::filesystem::remove_all(scratch_, ignored);
-  }
-
-  static std::filesystem::path makeScratch() {
-    std::string pattern = (std::filesystem::temp_directory_path() / "halvox-files-XXXXXX").string();
-    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
-    return pattern;
-  }
   // The code of the error that the file ends with, 0 when it was written.
   static std::int64_t codeOf(JsonArrayFile& file) {
     std::string path;
@@ -51,7 +40,8 @@ class FilesTest : public testing::Test {
   }
   std::uint64_t count(const char* name) { return statistics_.counter("files", name).value(); }
 
-  const std::filesystem::path scratch_ = makeScratch();
+  const ScratchDirectory directory_;
+  const std::filesystem::path scratch_ = directory_.path();
   const std::filesystem::path root_ = scratch_ / "root";
   const std::filesystem::path outside_ = scratch_ / "outside";
   CounterStatisticsService statistics_;
