@@ -9,9 +9,9 @@
 #include <thread>
 
 #include <gtest/gtest.h>
-#include <stdlib.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 
@@ -19,12 +19,6 @@ namespace halvox::platform::linux_ {
 // there at first.
 class SettingsTest : public testing::Test {
  protected:
-  SettingsTest() {
-    std::string pattern = (std::filesystem::temp_directory_path() / "halvox-settings-XXXXXX");
-    scratch_ = ::mkdtemp(pattern.data());
-  }
-  ~SettingsTest() override { std::filesystem::remove_all(scratch_); }
-
   [[nodiscard]] std::filesystem::path preferences() const { return scratch_ / "preferences"; }
   [[nodiscard]] std::filesystem::path notify() const { return scratch_ / "notify"; }
   [[nodiscard]] std::filesystem::path domainFile(const std::string& domain) const {
@@ -55,7 +49,8 @@ class SettingsTest : public testing::Test {
   }
 
   FakePlatform platform_;
-  std::filesystem::path scratch_;
+  const ScratchDirectory directory_;
+  std::filesystem::path scratch_ = directory_.path();
 };
 
 }  // namespace halvox::platform::linux_
