@@ -13,6 +13,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 
@@ -28,9 +29,6 @@ inline constexpr const char* kVariables[] = {"HALVOX_CONFIG",
 class ConfigurationTest : public ::testing::Test {
  protected:
   void SetUp() override {
-    std::string name = ::testing::TempDir() + "halvox-configuration-XXXXXX";
-    ASSERT_NE(::mkdtemp(name.data()), nullptr);
-    directory_ = name;
     for (const char* variable : kVariables) {
       if (const char* value = std::getenv(variable)) saved_[variable] = value;
       ::unsetenv(variable);
@@ -40,7 +38,6 @@ class ConfigurationTest : public ::testing::Test {
   void TearDown() override {
     for (const char* variable : kVariables) ::unsetenv(variable);
     for (const auto& [variable, value] : saved_) ::setenv(variable.c_str(), value.c_str(), 1);
-    std::filesystem::remove_all(directory_);
   }
 
   std::filesystem::path write(std::string_view text, const std::string& name = "halvox.toml") {
@@ -72,7 +69,8 @@ class ConfigurationTest : public ::testing::Test {
     return error->description.substr(prefix.size());
   }
 
-  std::filesystem::path directory_;
+  const ScratchDirectory scratch_;
+  const std::filesystem::path directory_ = scratch_.path();
   std::map<std::string, std::string> saved_;
 };
 
