@@ -12,6 +12,7 @@
 #include <unistd.h>
 
 #include "platform/linux/runtime/ThreadSetup.h"
+#include "platform/linux/settings/LinkedFiles.h"
 #include "platform/linux/settings/PreferenceFile.h"
 #include "platform/linux/settings/SettingNames.h"
 #include "platform/linux/settings/SettingsLog.h"
@@ -134,8 +135,10 @@ bool InotifyNotifyService::adoptRegistrations() {
 void InotifyNotifyService::arm() {
   const bool wasFailing = retryAt_.has_value();
   linked_ = settings_.linkedSettings();
+  notifyLinks_ = linkedFiles(directories_[kNotifyDirectory]);
   std::vector<std::filesystem::path> directories = directories_;
   for (const LinkedSetting& one : linked_) directories.push_back(one.file.parent_path());
+  for (const std::filesystem::path& link : notifyLinks_) directories.push_back(link.parent_path());
   const std::error_code error = watch_.arm(std::move(directories));
   retryAt_.reset();
   if (error) {
@@ -154,7 +157,16 @@ void InotifyNotifyService::arm() {
 
 // Whatever has changed, the links may have, and lead elsewhere now.
 void InotifyNotifyService::followLinks() {
-  if (settings_.hasNews() && settings_.linkedSettings() != linked_) arm();
+  if (!settings_.hasNews()) return;
+  if (settings_.linkedSettings() != linked_ ||
+      linkedFiles(directories_[kNotifyDirectory]) != notifyLinks_) {
+    arm();
+  }
+}
+
+bool InotifyNotifyService::isNotifyLink(std::size_t directory, std::string_view file) const {
+  const std::size_t first = kFirstLinked + linked_.size();
+  return directory >= first && notifyLinks_[directory - first].filename() == file;
 }
 
 // Whoever deletes the directory should read in the log why nothing is heard any more, and of its
@@ -172,9 +184,12 @@ void InotifyNotifyService::tellOfNotifyDirectory() {
 }
 
 void InotifyNotifyService::readChanges() {
-  const auto state = watch_.read(
-      [this](std::size_t directory, std::string_view file, DirectoryWatch::Change change) {
-        if (directory >= kFirstLinked) {
+  bool leadsElsewhere = false;
+  const auto state =
+      watch_.read([&](std::size_t directory, std::string_view file, DirectoryWatch::Change change) {
+        if (directory >= kFirstLinked + linked_.size()) {
+          leadsElsewhere = leadsElsewhere || isNotifyLink(directory, file);
+        } else if (directory >= kFirstLinked) {
           const LinkedSetting& linked = linked_[directory - kFirstLinked];
           if (linked.file.filename() == file) settings_.noteDomain(linked.domain);
         } else if (directory == kPreferenceDirectory) {
@@ -184,7 +199,7 @@ void InotifyNotifyService::readChanges() {
         }
         noteNews();
       });
-  if (state == DirectoryWatch::State::kMustBeArmedAgain) arm();
+  if (state == DirectoryWatch::State::kMustBeArmedAgain || leadsElsewhere) arm();
 }
 
 void InotifyNotifyService::noteNews() {

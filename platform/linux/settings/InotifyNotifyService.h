@@ -28,7 +28,8 @@ inline constexpr NotifyStatus kNotifyFailed = 1'000'000;
 //
 // A thread of its own waits for the files, from the first registration on; it sleeps while nothing
 // happens. Directories may be missing, and may be deleted and made again. Symbolic links on the way
-// to a preference file are followed: a change behind them, or of one of them, counts. When watching
+// to a preference file or to the directory of names are followed: a change behind them, or of one
+// of them, counts. When watching
 // fails (the kernel's limits) it says so once and tries again.
 class InotifyNotifyService final : public NotifyService {
  public:
@@ -62,16 +63,19 @@ class InotifyNotifyService final : public NotifyService {
   [[nodiscard]] bool adoptRegistrations() HALVOX_EXCLUDES(mutex_);
   void arm();
   void followLinks();
+  [[nodiscard]] bool isNotifyLink(std::size_t directory, std::string_view file) const;
   void tellOfNotifyDirectory();
   void readChanges();
   void noteNews();
   void deliver();
   [[nodiscard]] std::optional<Clock::time_point> nextWork() const;
 
-  // The directories that are always watched, in order; those of `linked_` come behind them.
+  // The directories that are always watched, in order; those of `linked_` and of `notifyLinks_`
+  // come behind them.
   const std::vector<std::filesystem::path> directories_;
   DirectoryWatch watch_;
-  std::vector<LinkedSetting> linked_;  // as watched
+  std::vector<LinkedSetting> linked_;               // as watched
+  std::vector<std::filesystem::path> notifyLinks_;  // the same for the directory of names
   bool hasNotifyDirectory_ = false;
   bool notifyDirectoryWasGone_ = false;
   WatchedSettings settings_;

@@ -329,6 +329,20 @@ TEST_F(InotifyNotifyServiceTest, ADirectoryOfPreferencesThatIsALinkIsFollowed) {
   EXPECT_EQ(postsOf([&] { write(scratch_ / "two" / "org.example.toml", "a = 4"); }), 1);
 }
 
+TEST_F(InotifyNotifyServiceTest, ADirectoryOfNamesThatIsALinkIsFollowed) {
+  std::filesystem::create_directories(scratch_ / "one");
+  std::filesystem::create_directories(scratch_ / "two");
+  std::filesystem::remove_all(notify());
+  std::filesystem::create_directory_symlink(scratch_ / "one", notify());
+  begin();
+
+  std::filesystem::create_directory_symlink(scratch_ / "two", scratch_ / "new");
+  std::filesystem::rename(scratch_ / "new", notify());
+
+  EXPECT_EQ(postsOf([&] { write(scratch_ / "two" / kName, ""); }), 1);
+  EXPECT_EQ(postsOf([&] { write(scratch_ / "one" / kName, ""); }), 0);
+}
+
 TEST_F(InotifyNotifyServiceTest, NoPreferenceIsMissedInAFloodOfEvents) {
   begin();
   std::filesystem::create_directories(preferences() / "mobile");
