@@ -45,6 +45,11 @@ std::optional<StoreError> StoreReader::open(const std::filesystem::path& directo
     return StoreError{kind,
                       files_->database().native() + ": " + std::system_category().message(errno)};
   }
+  // A pipe could keep us waiting for ever.
+  if (!S_ISREG(status.st_mode)) {
+    return StoreError{StoreError::Kind::kCannotOpen,
+                      files_->database().native() + ": expected a regular file, found another"};
+  }
   auto error = openDatabase();
   if (error.has_value()) {
     database_.close();

@@ -3,6 +3,8 @@
 #include <string>
 #include <vector>
 
+#include <sys/stat.h>
+
 #include "platform/linux/store/StoreTestSupport.h"
 
 namespace halvox::platform::linux_ {
@@ -160,6 +162,13 @@ TEST_F(StoreReaderTest, SaysThatThereIsNoStore) {
 TEST_F(StoreReaderTest, SaysThatNothingWasStoredYet) {
   writeFile(database(), "");
   EXPECT_EQ(openError(), StoreError::Kind::kMissing);
+}
+
+TEST_F(StoreReaderTest, APipeInThePlaceOfTheFileKeepsNobodyWaiting) {
+  std::filesystem::create_directories(options.directory);
+  ASSERT_EQ(::mkfifo((options.directory / "halvox.db").c_str(), 0600), 0);
+
+  EXPECT_EQ(openError(), StoreError::Kind::kCannotOpen);
 }
 
 TEST_F(StoreReaderTest, SaysThatTheFileIsDamagedAndLeavesItThere) {
