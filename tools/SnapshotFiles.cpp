@@ -29,10 +29,16 @@ using platform::linux_::SnapshotReadError;
 
 constexpr const char* kSignatureName = "signature.json";
 constexpr const char* kManifestName = "manifest.json";
+// One long name, which may come from anywhere, must not fill all lines with blanks.
+constexpr std::size_t kWidestColumn = 40;
 
 // The archive that an argument means, or how the run ends without one.
 std::variant<fs::path, ExitStatus> findSnapshot(const std::string& file,
                                                 const Complaint& complain) {
+  if (file.empty()) {
+    return complain(ExitStatus::kBadArguments,
+                    R"(FILE: "" is no file; expected an archive, or "newest")");
+  }
   if (file != "newest") return fs::path(file);
   const auto configuration = serviceConfiguration(complain);
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
@@ -101,6 +107,7 @@ void printText(const fs::path& file, const Contents& contents, std::ostream& out
       << secondsOf(contents.manifest) << "\n\nSignature\n";
   std::size_t width = 0;
   for (const auto& [key, value] : contents.signature) width = std::max(width, key.text().size());
+  width = std::min(width, kWidestColumn);
   for (const auto& [key, value] : contents.signature) {
     const std::string name(key.text());
     out << "  " << std::left << std::setw(static_cast<int>(width)) << harmlessText(name) << "  "
@@ -114,6 +121,7 @@ void printText(const fs::path& file, const Contents& contents, std::ostream& out
   for (const Value& item : list) {
     width = std::max(width, textOf(item.dictionary(), "name").size());
   }
+  width = std::min(width, kWidestColumn);
   for (const Value& item : list) printItem(item.dictionary(), width, out);
 }
 

@@ -98,6 +98,24 @@ TEST_F(SnapshotFilesTest, WhatIsNoSnapshotIsNamed) {
   EXPECT_THAT(errors_.str(), HasSubstr("manifest.json in it: "));
 }
 
+TEST_F(SnapshotFilesTest, AnEmptyNameIsABadArgument) {
+  EXPECT_EQ(show(""), ExitStatus::kBadArguments);
+  EXPECT_EQ(extract(""), ExitStatus::kBadArguments);
+
+  EXPECT_THAT(errors_.str(), HasSubstr("extract: FILE: \"\" is no file; expected an archive"));
+}
+
+TEST_F(SnapshotFilesTest, ALongNameDoesNotWidenTheOtherLines) {
+  const std::string longName(1000, 'n');
+  EXPECT_EQ(show(archive("20260301T120000Z", "x",
+                         R"({"items":[{"name":")" + longName +
+                             R"(","reason":"r"},{"name":"b","reason":"s"}]})")),
+            ExitStatus::kDone);
+
+  EXPECT_THAT(out_.str(), HasSubstr(longName + "  missing: r\n"));
+  EXPECT_THAT(out_.str(), HasSubstr("\n  b" + std::string(39, ' ') + "  missing: s\n"));
+}
+
 TEST_F(SnapshotFilesTest, NamesFromAnArchiveCannotDriveATerminal) {
   EXPECT_EQ(show(archive("20260301T120000Z", R"(a\u001b[2Jb)")), ExitStatus::kDone);
 

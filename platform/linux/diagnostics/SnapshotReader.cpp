@@ -4,6 +4,7 @@
 #include <array>
 #include <cerrno>
 #include <string_view>
+#include <system_error>
 
 #include <archive.h>
 #include <archive_entry.h>
@@ -28,6 +29,8 @@ constexpr std::size_t kBlock = 64U << 10U;
 constexpr std::uint64_t kMostBytes = 256U << 20U;
 constexpr std::size_t kMostEntries = 10'000;
 constexpr std::size_t kMostBytesOfText = 16U << 20U;
+// What the library says instead of an error of the system when a file has another format.
+constexpr int kUnknownFormat = EILSEQ;
 
 SnapshotReadError failed(const fs::path& snapshot, const std::string& why) {
   return {snapshot.native() + ": " + why};
@@ -44,9 +47,10 @@ class Walk {
   explicit Walk(const fs::path& snapshot) : snapshot_(snapshot), reader_(archive_read_new()) {}
 
   [[nodiscard]] Failure open() {
-    // A pipe could keep us waiting for ever.
+    // A pipe could keep us waiting for ever, and to the library no name is the standard input.
     struct stat status {};
-    if (::stat(snapshot_.c_str(), &status) == 0 && !S_ISREG(status.st_mode)) {
+    if (::stat(snapshot_.c_str(), &status) != 0) return failed(snapshot_, errorText(errno));
+    if (!S_ISREG(status.st_mode)) {
       return failed(snapshot_, S_ISDIR(status.st_mode) ? errorText(EISDIR) : "it is no file");
     }
     archive_read_support_format_tar(reader_.get());
@@ -55,6 +59,7 @@ class Walk {
       return std::nullopt;
     }
     const int error = archive_errno(reader_.get());
+    if (error == kUnknownFormat) return failed(snapshot_, "it is no snapshot");
     return failed(snapshot_, error > 0 ? errorText(error) : textOf(reader_.get()));
   }
 
@@ -144,11 +149,13 @@ class WorkingDirectory {
   const int error_;
 };
 
-Failure refuseExisting(const fs::path& snapshot, const fs::path& directory) {
+// Looks at all entries, so that an archive with a bad one leaves nothing behind.
+Failure check(const fs::path& snapshot, const fs::path& directory, ExistingFiles existing) {
   return forEachEntry(snapshot, [&](Walk&, archive_entry* entry) -> Failure {
     struct stat status {};
     const char* name = archive_entry_pathname(entry);
-    if (archive_entry_filetype(entry) == AE_IFREG && ::lstat(name, &status) == 0) {
+    if (existing == ExistingFiles::kRefuse && archive_entry_filetype(entry) == AE_IFREG &&
+        ::lstat(name, &status) == 0) {
       return SnapshotReadError{(directory / name).native() + ": it is there already"};
     }
     return std::nullopt;
@@ -170,6 +177,26 @@ Failure unpackEntry(archive* disk, Walk& walk, archive_entry* entry, const fs::p
   }
   if (archive_write_finish_entry(disk) != ARCHIVE_OK) return diskError();
   return std::nullopt;
+}
+
+// Into a directory that is there.
+std::variant<std::vector<std::string>, SnapshotReadError> unpack(const fs::path& source,
+                                                                 const fs::path& directory,
+                                                                 ExistingFiles existing) {
+  const WorkingDirectory inside(directory);
+  if (inside.error() != 0) return failed(directory, errorText(inside.error()));
+  if (Failure failure = check(source, directory, existing)) return std::move(*failure);
+  const DiskWriter disk(archive_write_disk_new());
+  archive_write_disk_set_options(disk.get(), ARCHIVE_EXTRACT_SECURE_SYMLINKS |
+                                                 ARCHIVE_EXTRACT_SECURE_NODOTDOT |
+                                                 ARCHIVE_EXTRACT_SECURE_NOABSOLUTEPATHS);
+  std::vector<std::string> names;
+  Failure failure = forEachEntry(source, [&](Walk& walk, archive_entry* entry) {
+    names.emplace_back(archive_entry_pathname(entry));
+    return unpackEntry(disk.get(), walk, entry, directory);
+  });
+  if (failure) return std::move(*failure);
+  return names;
 }
 
 }  // namespace
@@ -195,27 +222,17 @@ std::variant<std::map<std::string, std::string>, SnapshotReadError> readSnapshot
 std::variant<std::vector<std::string>, SnapshotReadError> extractSnapshot(const fs::path& snapshot,
                                                                           const fs::path& directory,
                                                                           ExistingFiles existing) {
-  const fs::path source = fs::absolute(snapshot);
+  // The working directory may be gone.
+  std::error_code error;
+  const fs::path source = fs::absolute(snapshot, error);
+  if (error) return failed(snapshot, error.message());
   if (::access(source.c_str(), R_OK) != 0) return failed(snapshot, errorText(errno));
-  if (::mkdir(directory.c_str(), 0700) != 0 && errno != EEXIST) {
-    return failed(directory, errorText(errno));
-  }
-  const WorkingDirectory inside(directory);
-  if (inside.error() != 0) return failed(directory, errorText(inside.error()));
-  if (existing == ExistingFiles::kRefuse) {
-    if (Failure failure = refuseExisting(source, directory)) return std::move(*failure);
-  }
-  const DiskWriter disk(archive_write_disk_new());
-  archive_write_disk_set_options(disk.get(), ARCHIVE_EXTRACT_SECURE_SYMLINKS |
-                                                 ARCHIVE_EXTRACT_SECURE_NODOTDOT |
-                                                 ARCHIVE_EXTRACT_SECURE_NOABSOLUTEPATHS);
-  std::vector<std::string> names;
-  Failure failure = forEachEntry(source, [&](Walk& walk, archive_entry* entry) {
-    names.emplace_back(archive_entry_pathname(entry));
-    return unpackEntry(disk.get(), walk, entry, directory);
-  });
-  if (failure) return std::move(*failure);
-  return names;
+  const bool isMade = ::mkdir(directory.c_str(), 0700) == 0;
+  if (!isMade && errno != EEXIST) return failed(directory, errorText(errno));
+  auto unpacked = unpack(source, directory, existing);
+  // Only an empty one goes.
+  if (isMade && unpacked.index() != 0) ::rmdir(directory.c_str());
+  return unpacked;
 }
 
 }  // namespace halvox::platform::linux_

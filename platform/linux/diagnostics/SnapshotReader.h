@@ -23,8 +23,9 @@ enum class ExistingFiles : std::uint8_t { kRefuse, kReplace };
 
 // Unpacks all files of a snapshot below a directory, which is made when it is missing; gives their
 // names. Anything but plain files and directories, names that lead out of the directory, and links
-// on the way are errors; so is, unless they may be replaced, a file that is there already: then
-// nothing is unpacked. Changes the process's working directory while it runs.
+// on the way are errors; so is, unless they may be replaced, a file that is there already. When the
+// archive itself shows the error, nothing is unpacked and no directory left behind. Changes the
+// process's working directory while it runs.
 [[nodiscard]] std::variant<std::vector<std::string>, SnapshotReadError> extractSnapshot(
     const std::filesystem::path& snapshot, const std::filesystem::path& directory,
     ExistingFiles existing);

@@ -92,7 +92,7 @@ TEST_F(SnapshotReaderTest, BrokenAndMissingArchivesAreNamed) {
   const auto missing = readSnapshotFiles(scratch.path() / "none", {"a"});
 
   ASSERT_EQ(broken.index(), 1U);
-  EXPECT_THAT(std::get<1>(broken).description, HasSubstr("a.tar.zst: "));
+  EXPECT_THAT(std::get<1>(broken).description, HasSubstr("a.tar.zst: it is no snapshot"));
   ASSERT_EQ(missing.index(), 1U);
   EXPECT_THAT(std::get<1>(missing).description, HasSubstr("No such file or directory"));
 }
@@ -101,8 +101,38 @@ TEST_F(SnapshotReaderTest, ArchiveThatIsTooLargeIsRefusedBeforeAnythingIsUnpacke
   const std::string zeros(257U << 20U, '\0');
 
   EXPECT_THAT(unpack({{"a", "1"}, {"zeros", zeros}}), HasSubstr("too large when unpacked"));
-  EXPECT_TRUE(std::filesystem::is_empty(target));
   EXPECT_EQ(readSnapshotFiles(archive, {"a"}).index(), 1U);
+}
+
+TEST_F(SnapshotReaderTest, RefusedArchiveLeavesNoFilesAndNoDirectory) {
+  EXPECT_NE(unpack({{"a", "1"}, {"../up", "x"}}), "");
+  EXPECT_FALSE(std::filesystem::exists(target));
+
+  std::filesystem::create_directories(target);
+  EXPECT_NE(unpack({{"a", "1"}, {"../up", "x"}}, ExistingFiles::kReplace), "");
+  EXPECT_TRUE(std::filesystem::is_empty(target));
+}
+
+TEST_F(SnapshotReaderTest, EmptyNameIsAFileThatIsMissing) {
+  EXPECT_EQ(extractSnapshot("", target, ExistingFiles::kRefuse).index(), 1U);
+  const auto read = readSnapshotFiles("", {"a"});
+
+  ASSERT_EQ(read.index(), 1U);
+  EXPECT_THAT(std::get<1>(read).description, HasSubstr("No such file or directory"));
+}
+
+TEST_F(SnapshotReaderTest, WorkingDirectoryThatIsGoneIsAnError) {
+  const std::filesystem::path before = std::filesystem::current_path();
+  const std::filesystem::path gone = scratch.path() / "gone";
+  std::filesystem::create_directories(gone);
+  std::filesystem::current_path(gone);
+  std::filesystem::remove(gone);
+
+  const auto result = extractSnapshot("a.tar.zst", target, ExistingFiles::kRefuse);
+  std::filesystem::current_path(before);
+
+  ASSERT_EQ(result.index(), 1U);
+  EXPECT_THAT(std::get<1>(result).description, HasSubstr("a.tar.zst: No such file or directory"));
 }
 
 TEST_F(SnapshotReaderTest, PipeInThePlaceOfAnArchiveKeepsNobodyWaiting) {
