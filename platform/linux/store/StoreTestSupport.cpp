@@ -1,24 +1,12 @@
 #include "platform/linux/store/StoreTestSupport.h"
 
 #include <algorithm>
-#include <cstdlib>
 #include <fstream>
 #include <iterator>
 #include <ostream>
 #include <thread>
 
 namespace halvox::platform::linux_ {
-
-ScratchDirectory::ScratchDirectory() {
-  std::string name = ::testing::TempDir() + "halvox-store-XXXXXX";
-  if (::mkdtemp(name.data()) == nullptr) throw std::runtime_error("no scratch directory");
-  path_ = name;
-}
-
-ScratchDirectory::~ScratchDirectory() {
-  std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
-}
 
 bool eventually(const std::function<bool()>& holds) {
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);

@@ -14,21 +14,9 @@
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/store/SqliteAnalyticsService.h"
 #include "platform/linux/store/SqliteStore.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
-
-// A directory that is removed with all its content.
-class ScratchDirectory {
- public:
-  ScratchDirectory();
-  ScratchDirectory(const ScratchDirectory&) = delete;
-  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
-  ~ScratchDirectory();
-  [[nodiscard]] const std::filesystem::path& path() const { return path_; }
-
- private:
-  std::filesystem::path path_;
-};
 
 // Waits until it holds, looking every millisecond; false after ten seconds.
 [[nodiscard]] bool eventually(const std::function<bool()>& holds);
