@@ -1,8 +1,6 @@
 #include "platform/linux/connection/testing/ServiceUnderTest.h"
 
 #include <algorithm>
-#include <cstdlib>
-#include <stdexcept>
 #include <utility>
 
 namespace halvox::platform::linux_ {
@@ -14,17 +12,6 @@ bool eventually(const std::function<bool()>& condition) {
     std::this_thread::sleep_for(std::chrono::milliseconds(1));
   }
   return true;
-}
-
-ScratchDirectory::ScratchDirectory() {
-  std::string name = (std::filesystem::temp_directory_path() / "halvox.XXXXXX").string();
-  if (mkdtemp(name.data()) == nullptr) throw std::runtime_error("no scratch directory");
-  path_ = name;
-}
-
-ScratchDirectory::~ScratchDirectory() {
-  std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
 }
 
 ServiceUnderTest::ServiceUnderTest(const std::function<void(ConnectionOptions&)>& configure) {

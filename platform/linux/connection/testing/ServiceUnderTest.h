@@ -11,6 +11,7 @@
 #include "platform/linux/connection/LinuxConnectionService.h"
 #include "platform/linux/connection/testing/TestInterface.h"
 #include "platform/linux/runtime/Backpressure.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 
@@ -19,19 +20,6 @@ inline constexpr std::chrono::seconds kTestDeadline{20};
 
 // True as soon as the condition holds, false when it does not within the deadline.
 bool eventually(const std::function<bool()>& condition);
-
-// A directory of its own, removed in the end.
-class ScratchDirectory {
- public:
-  ScratchDirectory();
-  ScratchDirectory(const ScratchDirectory&) = delete;
-  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
-  ~ScratchDirectory();
-  [[nodiscard]] const std::filesystem::path& path() const { return path_; }
-
- private:
-  std::filesystem::path path_;
-};
 
 // The service with the test's object, serving on a thread of its own in a scratch directory.
 class ServiceUnderTest {
