@@ -22,7 +22,7 @@ class FactsTest : public ::testing::Test {
   }
   Tree tree(const TreeBounds& bounds = {}) const { return readTree(root.path(), bounds, deadline); }
 
-  ScratchFolder root;
+  ScratchDirectory root;
   WaitableFlag stop;
   Deadline deadline{stop, Deadline::Clock::now() + std::chrono::seconds(30)};
 };

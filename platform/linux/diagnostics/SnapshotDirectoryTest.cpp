@@ -24,7 +24,7 @@ class SnapshotDirectoryTest : public ::testing::Test {
     return names;
   }
 
-  ScratchFolder scratch;
+  ScratchDirectory scratch;
   SnapshotDirectory directory{scratch.path()};
 };
 

@@ -22,7 +22,7 @@ class SnapshotReaderTest : public ::testing::Test {
     return error == nullptr ? "" : error->description;
   }
 
-  ScratchFolder scratch;
+  ScratchDirectory scratch;
   const std::filesystem::path archive = scratch.path() / "a.tar.zst";
   const std::filesystem::path target = scratch.path() / "out";
 };

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <array>
-#include <cstdlib>
 #include <fstream>
 #include <iterator>
 #include <system_error>
@@ -20,17 +19,6 @@ namespace fs = std::filesystem;
 constexpr std::chrono::seconds kPatience{30};
 
 }  // namespace
-
-ScratchFolder::ScratchFolder() {
-  std::string name = (fs::temp_directory_path() / "halvox-snapshots-XXXXXX").native();
-  EXPECT_NE(::mkdtemp(name.data()), nullptr);
-  path_ = name;
-}
-
-ScratchFolder::~ScratchFolder() {
-  std::error_code ignored;
-  fs::remove_all(path_, ignored);
-}
 
 void writeText(const fs::path& file, std::string_view text) {
   fs::create_directories(file.parent_path());

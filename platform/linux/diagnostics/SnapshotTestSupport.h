@@ -14,21 +14,9 @@
 
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/diagnostics/SnapshotDiagnosticReporterService.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
-
-// A directory that is removed with all its content.
-class ScratchFolder {
- public:
-  ScratchFolder();
-  ScratchFolder(const ScratchFolder&) = delete;
-  ScratchFolder& operator=(const ScratchFolder&) = delete;
-  ~ScratchFolder();
-  [[nodiscard]] const std::filesystem::path& path() const { return path_; }
-
- private:
-  std::filesystem::path path_;
-};
 
 void writeText(const std::filesystem::path& file, std::string_view text);
 [[nodiscard]] std::string readText(const std::filesystem::path& file);
@@ -75,7 +63,7 @@ class SnapshotTest : public ::testing::Test {
                                        counted("dropped: service ending"));
   }
 
-  ScratchFolder scratch;
+  ScratchDirectory scratch;
   FakePlatform platform;
   SnapshotOptions options;
   std::function<LogMemory::Contents()> log;
