@@ -1,6 +1,7 @@
 #include "platform/linux/link/nats/NatsLink.h"
 
 #include <algorithm>
+#include <system_error>
 #include <utility>
 
 #include "platform/linux/link/nats/NatsLog.h"
@@ -40,17 +41,20 @@ NatsLink::~NatsLink() { (void)close(); }
 void NatsLink::discover(const TLMReportingService::BackendsCallback& found) {
   std::optional<Array> servers;
   std::uint64_t waiter = 0;
+  std::string failure;
   {
     const MutexLock lock(mutex_);
     const bool isRefused = closeBy_.has_value();
+    if (!isRefused) failure = provideThread();
     if (!isRefused && isConnected_) {
       servers = servers_;
-    } else if (!isRefused) {
+    } else if (!isRefused && failure.empty()) {
       waiter = ++lastWaiter_;
       waiters_.push_back({waiter, found});
       wakeThread();
     }
   }
+  if (!failure.empty()) kLog.error("no server of the link is looked for: ", failure);
   if (waiter == 0) return found(servers);
   dispatch_.asyncAfterOnBackgroundQueue(kDiscoveryTime, [link = weak_from_this(), waiter] {
     if (const auto self = link.lock()) self->expire(waiter);
@@ -82,6 +86,7 @@ std::optional<Error> NatsLink::refusal(const OutgoingMessage& message) {
   if (!connection_ && !lastFailure_.empty() && std::chrono::steady_clock::now() < nextAttempt_) {
     return refuse("no server was reached: " + lastFailure_);
   }
+  if (const std::string failure = provideThread(); !failure.empty()) return refuse(failure);
   return std::nullopt;
 }
 
@@ -171,13 +176,20 @@ void NatsLink::keepForEver() {
   if (auto self = weak_from_this().lock()) kept->push_back(std::move(self));
 }
 
-void NatsLink::wakeThread() {
-  if (!thread_.joinable()) {
+// Why there is none; empty when there is one.
+std::string NatsLink::provideThread() {
+  if (thread_.joinable()) return {};
+  try {
     thread_ = std::thread([this] { run(); });
-  } else if (isIdle_) {
-    isIdle_ = false;
-    changed_.notifyAll();
+    return {};
+  } catch (const std::system_error& error) {
+    return std::string("no thread for the link: ") + error.what();
   }
+}
+
+void NatsLink::wakeThread() {
+  if (!std::exchange(isIdle_, false)) return;
+  changed_.notifyAll();
 }
 
 // Whether there is nothing left to do after close(), or no time.

@@ -110,6 +110,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   Step nextStepConnected(Time now) HALVOX_REQUIRES(mutex_);
   std::optional<Time> nextTime() HALVOX_REQUIRES(mutex_);
   void waitForChange() HALVOX_REQUIRES(mutex_);
+  [[nodiscard]] std::string provideThread() HALVOX_REQUIRES(mutex_);
   void wakeThread() HALVOX_REQUIRES(mutex_);
   void end() HALVOX_EXCLUDES(mutex_);
   [[nodiscard]] bool awaitThread() HALVOX_EXCLUDES(mutex_);
@@ -118,6 +119,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   void answerWaiters() HALVOX_EXCLUDES(mutex_);
   void expire(std::uint64_t waiter) HALVOX_EXCLUDES(mutex_);
   void countRefused();
+  // Provides the thread when the message can be taken.
   [[nodiscard]] std::optional<Error> refusal(const OutgoingMessage& message)
       HALVOX_REQUIRES(mutex_);
 
