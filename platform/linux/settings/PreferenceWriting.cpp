@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <cstdlib>
 #include <system_error>
+#include <thread>
 #include <utility>
 
 #include <fcntl.h>
@@ -71,6 +72,19 @@ std::optional<PreferenceFileError> replace(const std::filesystem::path& file,
   return std::nullopt;
 }
 
+// False when it cannot be locked, or is not free within that time.
+bool lock(int directory, std::chrono::milliseconds patience) {
+  constexpr std::chrono::milliseconds kPause{10};
+  const auto end = std::chrono::steady_clock::now() + patience;
+  while (::flock(directory, LOCK_EX | LOCK_NB) != 0) {
+    if (errno == EINTR) continue;
+    if (errno != EWOULDBLOCK || std::chrono::steady_clock::now() >= end) return false;
+    // The system tells nobody when a lock becomes free.
+    std::this_thread::sleep_for(kPause);
+  }
+  return true;
+}
+
 // The file that a link stands for, be it there or not, so that the link stays.
 std::filesystem::path target(const std::filesystem::path& file) {
   std::error_code error;
@@ -84,14 +98,19 @@ std::filesystem::path target(const std::filesystem::path& file) {
 }  // namespace
 
 std::optional<PreferenceFileError> changePreferenceFile(const std::filesystem::path& named,
-                                                        const PreferenceEdit& edit) {
+                                                        const PreferenceEdit& edit,
+                                                        std::chrono::milliseconds patience) {
   const std::filesystem::path file = target(named);
   const std::filesystem::path directory = file.parent_path();
   std::error_code error;
   std::filesystem::create_directories(directory, error);
   if (error) return failure(directory, error.value());
   const UniqueFd held(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (!held || ::flock(held.get(), LOCK_EX) != 0) return failure(directory, errno);
+  if (!held) return failure(directory, errno);
+  if (!lock(held.get(), patience)) {
+    if (errno != EWOULDBLOCK) return failure(directory, errno);
+    return PreferenceFileError{directory.native() + ": another program keeps it locked"};
+  }
 
   auto content = readPreferenceText(file);
   if (auto* problem = std::get_if<PreferenceFileError>(&content)) return std::move(*problem);

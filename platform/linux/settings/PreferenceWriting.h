@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <filesystem>
 #include <functional>
 #include <optional>
@@ -17,9 +18,11 @@ using PreferenceEdit = std::function<std::variant<std::string, PreferenceFileErr
 
 // Changes a preference file as a whole or not at all: what is written is on the disk before it
 // takes the old file's place, with the same permissions. Makes the file and its directories when
-// they are missing. Others who change files of that directory in the same way wait, so that no
-// change is lost. A file that would stay as it is is not written. Gives what went wrong.
-std::optional<PreferenceFileError> changePreferenceFile(const std::filesystem::path& named,
-                                                        const PreferenceEdit& edit);
+// they are missing. Others who change files of that directory in the same way wait, for so long at
+// most, so that no change is lost. A file that would stay as it is is not written. Gives what went
+// wrong.
+std::optional<PreferenceFileError> changePreferenceFile(
+    const std::filesystem::path& named, const PreferenceEdit& edit,
+    std::chrono::milliseconds patience = std::chrono::seconds(5));
 
 }  // namespace halvox::platform::linux_

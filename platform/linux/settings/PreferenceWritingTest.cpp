@@ -2,6 +2,8 @@
 
 #include <csignal>
 
+#include <fcntl.h>
+#include <sys/file.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -113,6 +115,19 @@ TEST_F(PreferenceWritingTest, AFailedWriteLeavesTheOldFileAndNothingElse) {
   EXPECT_EQ(error->description, file_.native() + ": File too large");
   EXPECT_EQ(read(file_), "a = 1\n");
   EXPECT_EQ(filesBeside(), 1U);
+}
+
+TEST_F(PreferenceWritingTest, ADirectoryThatStaysLockedIsAnError) {
+  write(file_, "a = 1\n");
+  const int directory = ::open(file_.parent_path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  ASSERT_EQ(::flock(directory, LOCK_EX), 0);
+
+  const auto error = changePreferenceFile(file_, to("a = 2\n"), std::chrono::milliseconds(20));
+  ::close(directory);
+
+  ASSERT_TRUE(error.has_value());
+  EXPECT_EQ(error->description, file_.parent_path().native() + ": another program keeps it locked");
+  EXPECT_EQ(read(file_), "a = 1\n");
 }
 
 TEST_F(PreferenceWritingTest, ARefusedEditLeavesTheFileAlone) {
