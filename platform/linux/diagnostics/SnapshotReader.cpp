@@ -165,7 +165,10 @@ Failure check(const fs::path& snapshot, const fs::path& directory, ExistingFiles
 Failure unpackEntry(archive* disk, Walk& walk, archive_entry* entry, const fs::path& directory) {
   const std::string name = archive_entry_pathname(entry);
   const auto diskError = [&] {
-    return SnapshotReadError{(directory / name).native() + ": " + textOf(disk)};
+    // The library's text says what failed, and this why.
+    const int error = archive_errno(disk);
+    return SnapshotReadError{(directory / name).native() + ": " + textOf(disk) +
+                             (error > 0 ? ": " + errorText(error) : std::string())};
   };
   if (archive_write_header(disk, entry) != ARCHIVE_OK) return diskError();
   if (archive_entry_filetype(entry) == AE_IFREG) {

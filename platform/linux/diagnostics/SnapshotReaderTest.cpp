@@ -113,6 +113,12 @@ TEST_F(SnapshotReaderTest, RefusedArchiveLeavesNoFilesAndNoDirectory) {
   EXPECT_TRUE(std::filesystem::is_empty(target));
 }
 
+TEST_F(SnapshotReaderTest, WhatCannotBeUnpackedIsNamedWithTheReason) {
+  EXPECT_THAT(unpack({{"a", "1"}, {"a/b", "2"}}), HasSubstr("out/a/b: "));
+  EXPECT_THAT(unpack({{"a", "1"}, {"a/b", "2"}}, ExistingFiles::kReplace),
+              HasSubstr("Not a directory"));
+}
+
 TEST_F(SnapshotReaderTest, EmptyNameIsAFileThatIsMissing) {
   EXPECT_EQ(extractSnapshot("", target, ExistingFiles::kRefuse).index(), 1U);
   const auto read = readSnapshotFiles("", {"a"});
