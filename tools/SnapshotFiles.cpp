@@ -7,6 +7,7 @@
 #include <optional>
 #include <sstream>
 #include <string>
+#include <system_error>
 #include <utility>
 #include <variant>
 #include <vector>
@@ -46,6 +47,11 @@ std::variant<fs::path, ExitStatus> findSnapshot(const std::string& file,
       std::get<platform::linux_::Configuration>(configuration).storage.directory);
   const auto all = directory.newestFirst();
   if (all.empty()) {
+    std::error_code error;
+    const fs::directory_iterator opened(directory.path(), error);
+    if (error && error != std::errc::no_such_file_or_directory) {
+      return complain(ExitStatus::kNoService, directory.path().native() + ": " + error.message());
+    }
     return complain(ExitStatus::kNoService, "there is no snapshot in " + directory.path().native());
   }
   return all.front();

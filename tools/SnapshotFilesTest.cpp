@@ -89,6 +89,14 @@ TEST_F(SnapshotFilesTest, WithoutSnapshotsThereIsNoNewest) {
   EXPECT_THAT(errors_.str(), HasSubstr("halvoxctl snapshots show: there is no snapshot in "));
 }
 
+TEST_F(SnapshotFilesTest, ADirectoryOfSnapshotsThatCannotBeReadIsToldWithTheReason) {
+  fs::remove_all(directory_ / "state/snapshots");
+  std::ofstream(directory_ / "state/snapshots") << "in the way";
+
+  EXPECT_EQ(show("newest"), ExitStatus::kNoService);
+  EXPECT_THAT(errors_.str(), HasSubstr("state/snapshots: Not a directory"));
+}
+
 TEST_F(SnapshotFilesTest, WhatIsNoSnapshotIsNamed) {
   EXPECT_EQ(show((directory_ / "none").native()), ExitStatus::kBadArguments);
   EXPECT_EQ(show((directory_ / "halvox.toml").native()), ExitStatus::kBadArguments);
