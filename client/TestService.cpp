@@ -5,7 +5,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <filesystem>
 #include <utility>
 
 #include <poll.h>
@@ -260,19 +259,8 @@ TestService::Session* TestService::find(ReporterID id) {
   return nullptr;
 }
 
-ScratchDirectory::ScratchDirectory() {
-  std::string pattern = std::filesystem::temp_directory_path() / "halvox-test-XXXXXX";
-  if (mkdtemp(pattern.data()) == nullptr) giveUp("mkdtemp");
-  path_ = pattern;
-}
-
-ScratchDirectory::~ScratchDirectory() {
-  std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
-}
-
 std::string ScratchDirectory::path(std::string_view name) const {
-  return path_ + "/" + std::string(name);
+  return (directory_.path() / name).string();
 }
 
 bool eventually(const std::function<bool()>& holds) {

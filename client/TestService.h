@@ -15,6 +15,7 @@
 #include "client/HalvoxClient.h"
 #include "platform/linux/Mutex.h"
 #include "platform/linux/UniqueHandle.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::client {
 
@@ -101,14 +102,10 @@ class TestService {
 // A new directory of a test's own, removed with all that is in it.
 class ScratchDirectory {
  public:
-  ScratchDirectory();
-  ~ScratchDirectory();
-  ScratchDirectory(const ScratchDirectory&) = delete;
-  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
   [[nodiscard]] std::string path(std::string_view name) const;
 
  private:
-  std::string path_;
+  platform::linux_::ScratchDirectory directory_;
 };
 
 // Waits until something holds, looking often, for as long as a slow machine may need.
