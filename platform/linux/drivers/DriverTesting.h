@@ -10,8 +10,6 @@
 #include <utility>
 #include <vector>
 
-#include <stdlib.h>
-
 #include "platform/linux/drivers/DriverSamples.h"
 #include "platform/linux/drivers/DriverSource.h"
 
@@ -101,24 +99,5 @@ inline DriverSamples samplesOf(std::shared_ptr<const Reading> reading) {
   for (std::uint32_t index = 0; index < reading->channels->size(); ++index) all->push_back(index);
   return DriverSamples({{std::move(reading), std::move(all)}});
 }
-
-// A directory of its own for each test.
-class TemporaryDirectory {
- public:
-  TemporaryDirectory() {
-    std::string path = (std::filesystem::temp_directory_path() / "halvox-drivers-XXXXXX").string();
-    if (mkdtemp(path.data()) != nullptr) path_ = path;
-  }
-  TemporaryDirectory(const TemporaryDirectory&) = delete;
-  TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
-  ~TemporaryDirectory() {
-    std::error_code ignored;
-    std::filesystem::remove_all(path_, ignored);
-  }
-  [[nodiscard]] const std::filesystem::path& path() const { return path_; }
-
- private:
-  std::filesystem::path path_;
-};
 
 }  // namespace halvox::platform::linux_::testing

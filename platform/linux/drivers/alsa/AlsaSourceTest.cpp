@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -52,7 +53,7 @@ class AlsaSourceTest : public ::testing::Test {
     return testing::describe(*makeDelta(samplesOf(before), samplesOf(source_.read())));
   }
 
-  testing::TemporaryDirectory root_;
+  ScratchDirectory root_;
   AlsaSource::Clock::time_point now_{100s};
   AlsaSource source_{root_.path(), [this] { return now_; }};
 };

@@ -13,6 +13,7 @@
 
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 #include "reporters/pipewire/PrivatePipeWire.h"
 
 namespace halvox::platform::linux_ {
@@ -74,7 +75,7 @@ constexpr std::string_view kCycles = "demo-speakers/Speaker/PipeWire/cycles";
 // Without a server to ask.
 TEST(PipewireSourceAloneTest, OnlyTheConnectionsAreThereAndOpeningDoesNotWait) {
   const FakePlatform platform;
-  const testing::TemporaryDirectory directory;
+  const ScratchDirectory directory;
   setenv("XDG_RUNTIME_DIR", directory.path().c_str(), 1);
   // Were it to wait, it would be for that long.
   PipewireSource source({.longestOpening = 1h});

@@ -8,6 +8,7 @@
 #include <stdlib.h>
 
 #include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -46,7 +47,7 @@ class ServerWatchTest : public ::testing::Test {
   }
   static void create(const std::filesystem::path& path) { std::ofstream(path) << "."; }
 
-  const testing::TemporaryDirectory directory;
+  const ScratchDirectory directory;
   std::unique_ptr<pw_loop, LoopDeleter> loop;
 
  private:
@@ -74,7 +75,7 @@ TEST_F(ServerWatchTest, TellsOfANameThatWasMovedIn) {
 }
 
 TEST_F(ServerWatchTest, AnAbsoluteNameIsWatchedWhereItIs) {
-  const testing::TemporaryDirectory other;
+  const ScratchDirectory other;
   setenv("PIPEWIRE_REMOTE", (other.path() / "audio").c_str(), 1);
   ServerWatch watch = makeWatch();
   watch.begin();

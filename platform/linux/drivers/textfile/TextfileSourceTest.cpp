@@ -9,6 +9,7 @@
 
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -39,7 +40,7 @@ class TextfileSourceTest : public ::testing::Test {
   }
 
   FakePlatform platform_;
-  testing::TemporaryDirectory directory_;
+  ScratchDirectory directory_;
   TextfileSource source_{directory_.path()};
 };
 
