@@ -4,13 +4,13 @@
 #include <filesystem>
 #include <fstream>
 #include <limits>
-#include <stdexcept>
 #include <string>
 
 #include <gtest/gtest.h>
 #include <rapidjson/document.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -20,17 +20,7 @@ constexpr const char* kPath = "/logs/traces/results.ssj";
 class JsonResultsFileServiceTest : public testing::Test {
  protected:
   JsonResultsFileServiceTest() { std::filesystem::create_directories(root_ / "logs/traces"); }
-  ~JsonResultsFileServiceTest() override {
-    std::error_code ignored;
-    std::filesystem::remove_all(scratch_, ignored);
-  }
 
-  static std::filesystem::path makeScratch() {
-    std::string pattern =
-        (std::filesystem::temp_directory_path() / "halvox-results-XXXXXX").string();
-    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
-    return pattern;
-  }
   ResultsFileService::Writer open(const char* path = kPath) {
     return service_.sswriter_open(path, "Product", 4, 0);
   }
@@ -49,7 +39,8 @@ class JsonResultsFileServiceTest : public testing::Test {
   }
 
   FakePlatform platform_;
-  const std::filesystem::path scratch_ = makeScratch();
+  const ScratchDirectory directory_;
+  const std::filesystem::path scratch_ = directory_.path();
   const std::filesystem::path root_ = scratch_ / "root";
   JsonResultsFileService service_{root_, platform_.statistics};
 };

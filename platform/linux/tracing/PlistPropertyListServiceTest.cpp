@@ -5,27 +5,18 @@
 #include <filesystem>
 #include <fstream>
 #include <span>
-#include <stdexcept>
 #include <string>
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
 class PlistPropertyListServiceTest : public testing::Test {
  protected:
-  ~PlistPropertyListServiceTest() override {
-    std::error_code ignored;
-    std::filesystem::remove_all(scratch_, ignored);
-  }
-
-  static std::filesystem::path makeScratch() {
-    std::string pattern = (std::filesystem::temp_directory_path() / "halvox-plist-XXXXXX").string();
-    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
-    return pattern;
-  }
   static bool runs(const std::string& command) {
     return std::system((command + " >/dev/null 2>&1").c_str()) == 0;
   }
@@ -50,7 +41,8 @@ class PlistPropertyListServiceTest : public testing::Test {
     return parse(text).has_value() ? "" : error_.value_or(Error{}).description;
   }
 
-  const std::filesystem::path scratch_ = makeScratch();
+  const ScratchDirectory directory_;
+  const std::filesystem::path scratch_ = directory_.path();
   const PlistPropertyListService service_{};
   std::optional<Error> error_;
 };

@@ -6,13 +6,14 @@
 #include <filesystem>
 #include <fstream>
 #include <iterator>
-#include <stdexcept>
 #include <string>
 
 #include <gtest/gtest.h>
 #include <lttng/lttng.h>
 #include <sys/wait.h>
 #include <unistd.h>
+
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -28,17 +29,8 @@ class SessionDaemonTest : public testing::Test {
     ::setenv("HOME", scratch_.c_str(), 1);
     if (::lttng_session_daemon_alive() == 1) GTEST_SKIP() << "a tracer's daemon of root's runs";
   }
-  ~SessionDaemonTest() override {
-    ::setenv("PATH", path_.c_str(), 1);
-    std::error_code ignored;
-    fs::remove_all(scratch_, ignored);
-  }
+  ~SessionDaemonTest() override { ::setenv("PATH", path_.c_str(), 1); }
 
-  static fs::path makeScratch() {
-    std::string pattern = (fs::temp_directory_path() / "halvox-daemon-XXXXXX").string();
-    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
-    return pattern;
-  }
   // The program notes its process and then does as told.
   void writeProgram(const std::string& rest) {
     const fs::path program = scratch_ / "lttng-sessiond";
@@ -68,7 +60,8 @@ class SessionDaemonTest : public testing::Test {
   }
 
   const std::string path_ = ::getenv("PATH");
-  const fs::path scratch_ = makeScratch();
+  const ScratchDirectory directory_;
+  const fs::path scratch_ = directory_.path();
   const fs::path note_ = scratch_ / "note";
   const fs::path pidFile_ = scratch_ / "pid";
   SessionDaemon daemon_{note_,

@@ -5,11 +5,12 @@
 #include <filesystem>
 #include <fstream>
 #include <random>
-#include <stdexcept>
 #include <string>
 
 #include <gtest/gtest.h>
 #include <sys/resource.h>
+
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -26,16 +27,7 @@ class TraceArchiveTest : public testing::Test {
     std::mt19937_64 random(1);
     for (int word = 0; word < 100'000; ++word) file << random();
   }
-  ~TraceArchiveTest() override {
-    std::error_code ignored;
-    fs::remove_all(scratch_, ignored);
-  }
 
-  static fs::path makeScratch() {
-    std::string pattern = (fs::temp_directory_path() / "halvox-archive-XXXXXX").string();
-    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
-    return pattern;
-  }
   // No file of this process grows beyond that.
   static void limitFiles() {
     const rlimit limit{.rlim_cur = 65'536, .rlim_max = 65'536};
@@ -43,9 +35,9 @@ class TraceArchiveTest : public testing::Test {
   }
   static bool isEmpty(const fs::path& directory) { return fs::is_empty(directory); }
 
-  const fs::path scratch_ = makeScratch();
-  const fs::path directory_ = scratch_ / "recordings/one";
-  const fs::path archives_ = scratch_ / "archives";
+  const ScratchDirectory scratch_;
+  const fs::path directory_ = scratch_.path() / "recordings/one";
+  const fs::path archives_ = scratch_.path() / "archives";
   const fs::path archive_ = archives_ / "one.tar.zst";
 };
 
@@ -83,7 +75,7 @@ TEST_F(TraceArchiveTest, FileThatCannotBeWrittenIsToldAndLeavesNothing) {
 }
 
 TEST_F(TraceArchiveTest, DirectoryThatIsMissingIsTold) {
-  EXPECT_NE(packDirectory(scratch_ / "recordings/none", archive_), std::nullopt);
+  EXPECT_NE(packDirectory(scratch_.path() / "recordings/none", archive_), std::nullopt);
 
   EXPECT_TRUE(isEmpty(archives_));
 }
