@@ -9,6 +9,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/linux/diagnostics/SnapshotArchive.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::tools {
 namespace {
@@ -26,18 +27,12 @@ constexpr const char* kManifest =
 class SnapshotFilesTest : public ::testing::Test {
  protected:
   SnapshotFilesTest() {
-    std::string name = (fs::temp_directory_path() / "halvox-tools-XXXXXX").native();
-    EXPECT_NE(::mkdtemp(name.data()), nullptr);
-    directory_ = name;
     fs::create_directories(directory_ / "state/snapshots");
     std::ofstream(directory_ / "halvox.toml")
         << "[storage]\ndirectory = \"" << (directory_ / "state").native() << "\"\n";
     ::setenv("HALVOX_CONFIG", (directory_ / "halvox.toml").c_str(), 1);
   }
-  ~SnapshotFilesTest() override {
-    ::unsetenv("HALVOX_CONFIG");
-    fs::remove_all(directory_);
-  }
+  ~SnapshotFilesTest() override { ::unsetenv("HALVOX_CONFIG"); }
 
   fs::path archive(const std::string& stamp, const std::string& process = "player",
                    const std::string& manifest = kManifest) {
@@ -60,7 +55,8 @@ class SnapshotFilesTest : public ::testing::Test {
         OutputForm::kText, out_, errors_);
   }
 
-  fs::path directory_;
+  const platform::linux_::ScratchDirectory scratch_;
+  const fs::path directory_ = scratch_.path();
   std::ostringstream out_;
   std::ostringstream errors_;
 };

@@ -4,12 +4,12 @@
 #include <filesystem>
 #include <fstream>
 #include <sstream>
-#include <stdexcept>
 #include <string>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include "platform/linux/testing/ScratchDirectory.h"
 #include "tools/SummaryReader.h"
 
 namespace halvox::tools {
@@ -33,17 +33,8 @@ class SummaryTest : public testing::Test {
     std::ofstream(scratch_ / "halvox.toml")
         << "[storage]\nroot = \"" << (scratch_ / "root").string() << "\"\n";
   }
-  ~SummaryTest() override {
-    ::unsetenv("HALVOX_CONFIG");
-    std::error_code ignored;
-    fs::remove_all(scratch_, ignored);
-  }
+  ~SummaryTest() override { ::unsetenv("HALVOX_CONFIG"); }
 
-  static fs::path makeScratch() {
-    std::string pattern = (fs::temp_directory_path() / "halvox-summary-XXXXXX").string();
-    if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
-    return pattern;
-  }
   std::string write(const fs::path& name, const std::string& text) {
     fs::create_directories((scratch_ / name).parent_path());
     std::ofstream(scratch_ / name) << text;
@@ -65,7 +56,8 @@ class SummaryTest : public testing::Test {
 
   static constexpr const char* kStore =
       "root/private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
-  const fs::path scratch_ = makeScratch();
+  const platform::linux_::ScratchDirectory directory_;
+  const fs::path scratch_ = directory_.path();
   std::ostringstream out_;
   std::ostringstream errors_;
 };
