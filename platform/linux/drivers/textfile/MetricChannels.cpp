@@ -161,11 +161,14 @@ class ChannelMaker {
   void addStates(const MetricFamily& family);
   void addStateChannel(const MetricFamily& family, const MetricLabels& labels,
                        const std::vector<const MetricSample*>& samples);
+  std::uint64_t stateCount(const MetricFamily& counter, const MetricSample& state);
   void refuseDoubles() const;
 
   const OpenMetricsText::Families& families_;
   std::unordered_map<std::string, const MetricFamily*> byName_;
   std::unordered_map<const MetricFamily*, bool> claimed_;
+  // The samples of the counters of state sets: each is looked for as often as there are states.
+  std::unordered_map<const MetricFamily*, std::map<MetricLabels, const MetricSample*>> counts_;
   std::vector<MetricChannel> channels_;
 };
 
@@ -251,11 +254,18 @@ void ChannelMaker::addStates(const MetricFamily& family) {
 }
 
 // The counter's value for the state, whose sample has the same labels.
-std::uint64_t stateCount(const MetricFamily& counter, const MetricSample& state) {
-  for (const MetricSample& sample : counter.samples) {
-    if (!isCreationTime(sample) && sample.labels == state.labels) return countOf(sample);
+std::uint64_t ChannelMaker::stateCount(const MetricFamily& counter, const MetricSample& state) {
+  const auto [found, isNew] = counts_.try_emplace(&counter);
+  if (isNew) {
+    for (const MetricSample& sample : counter.samples) {
+      if (!isCreationTime(sample)) found->second.emplace(sample.labels, &sample);
+    }
   }
-  refuse(state.line, "expected " + counter.name + " of this state too");
+  const auto count = found->second.find(state.labels);
+  if (count == found->second.end()) {
+    refuse(state.line, "expected " + counter.name + " of this state too");
+  }
+  return countOf(*count->second);
 }
 
 void ChannelMaker::addStateChannel(const MetricFamily& family, const MetricLabels& labels,

@@ -1,5 +1,7 @@
 #include "platform/linux/drivers/textfile/MetricChannels.h"
 
+#include <ctime>
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -156,6 +158,45 @@ INSTANTIATE_TEST_SUITE_P(
                   "# TYPE a gauge\na{channel=\"x\"} 1\n# TYPE b gauge\nb{channel=\"x\"} 1\n",
                   "line 4: this channel was told before, in line 2"}),
     [](const auto& one) { return one.param.name; });
+
+// The text has as many values of each of three metrics, the first two of the given type.
+std::string threeMetrics(const std::string& type, const std::string& counters) {
+  constexpr int kChannels = 5'800;
+  std::string states = "# TYPE m " + type + "\n";
+  std::string residency = "# TYPE m_residency " + counters + "\n";
+  std::string transitions = "# TYPE m_transitions " + counters + "\n";
+  const std::string suffix = counters == "counter" ? "_total" : "";
+  for (int channel = 0; channel < kChannels; ++channel) {
+    const std::string labels = "{channel=\"" + std::to_string(channel) + "\",m=\"on\"} 1\n";
+    states.append("m").append(labels);
+    residency.append("m_residency").append(suffix).append(labels);
+    transitions.append("m_transitions").append(suffix).append(labels);
+  }
+  return states + residency + transitions;
+}
+
+// Of this thread, so that other work of the machine does not count.
+double secondsToRead(const std::string& text) {
+  const auto now = [] {
+    timespec time{};
+    ::clock_gettime(CLOCK_THREAD_CPUTIME_ID, &time);
+    return static_cast<double>(time.tv_sec) + 1e-9 * static_cast<double>(time.tv_nsec);
+  };
+  const double begin = now();
+  const auto made = OpenMetricsText::parse(text);
+  (void)MetricChannels::from(text);
+  return std::holds_alternative<MetricError>(made) ? 0 : now() - begin;
+}
+
+TEST(MetricChannelsTest, StatesAreFoundAmongManyWithoutLookingAtAll) {
+  // What as many values of a type take that makes no channels.
+  const double plain = secondsToRead(threeMetrics("info", "unknown"));
+  const double states = secondsToRead(threeMetrics("stateset", "counter"));
+
+  EXPECT_GT(plain, 0);
+  // Looking at all counters for each state takes ten times as long.
+  EXPECT_LT(states, 5 * plain);
+}
 
 TEST(OpenMetricsTextTest, SizesAreBounded) {
   std::string labels;
