@@ -178,11 +178,10 @@ void LttngKtraceService::ktrace_end(const Session& session, int /*reason*/) {
 // On the service's thread.
 void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& session) {
   if (session->recording.has_value()) {
-    if (const auto failure = control_.end(*session->recording)) {
-      failed_.add();
-      kLog.error("kernel trace incomplete: ", *failure);
-    }
-    deliverAll(session);
+    const auto failure = control_.end(*session->recording);
+    if (failure) kLog.error("kernel trace incomplete: ", *failure);
+    const bool isRead = deliverAll(session);
+    if (failure || !isRead) failed_.add();
     control_.discard(*session->recording);
   }
   if (session->queue == nullptr) return;
@@ -191,7 +190,7 @@ void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& sessi
   });
 }
 
-void LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& session) {
+bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& session) {
   auto batch = std::make_shared<Batch>(dropped_);
   const auto deliver = [&] {
     auto full = std::exchange(batch, std::make_shared<Batch>(dropped_));
@@ -218,8 +217,10 @@ void LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
   lost_.add(reading.lost);
   lostPackets_.add(reading.lostPackets);
   if (reading.failure) kLog.error("kernel trace cannot be read back: ", *reading.failure);
-  if (reading.lost + reading.lostPackets == 0) return;
-  kLog.error("kernel trace lost ", reading.lost, " events and ", reading.lostPackets, " packets");
+  if (reading.lost + reading.lostPackets > 0) {
+    kLog.error("kernel trace lost ", reading.lost, " events and ", reading.lostPackets, " packets");
+  }
+  return !reading.failure.has_value();
 }
 
 void LttngKtraceService::ktrace_session_destroy(const Session& session) {

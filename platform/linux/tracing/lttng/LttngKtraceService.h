@@ -61,7 +61,8 @@ class LttngKtraceService final : public KtraceService {
 
  private:
   void finish(const std::shared_ptr<LttngKtraceSession>& session);
-  void deliverAll(const std::shared_ptr<LttngKtraceSession>& session);
+  // Whether the recording could be read to its end.
+  bool deliverAll(const std::shared_ptr<LttngKtraceSession>& session);
   std::shared_ptr<DispatchQueue> readingQueue();
 
   static constexpr unsigned kBatchesAhead = 8;
