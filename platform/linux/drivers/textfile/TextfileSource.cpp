@@ -63,11 +63,12 @@ std::string fullName(const ChannelDescription& channel) {
 
 std::shared_ptr<const Reading> TextfileSource::read() {
   ++round_;
+  std::size_t room = kMostBytes;
   const UniqueFd directory = openDirectory(directory_.c_str());
   for (const std::string& file : directory ? list(directory.get()) : std::vector<std::string>()) {
     Entry& entry = entries_[file];
     entry.round = round_;
-    readEntry(directory.get(), file, entry);
+    readEntry(directory.get(), file, room, entry);
   }
   isChanged_ |=
       std::erase_if(entries_, [this](const auto& item) { return item.second.round != round_; }) > 0;
@@ -102,19 +103,37 @@ std::vector<std::string> TextfileSource::list(int directory) {
   return files;
 }
 
-void TextfileSource::readEntry(int directory, const std::string& file, Entry& entry) {
+void TextfileSource::readEntry(int directory, const std::string& file, std::size_t& room,
+                               Entry& entry) {
   struct stat status {};
   State state;
   if (::fstatat(directory, file.c_str(), &status, 0) != 0) {
     state.error = errno;
   } else {
-    state = {0, status.st_dev, status.st_ino, status.st_size, nanoseconds(status.st_mtim)};
+    // A file that is too large by itself takes no room.
+    const std::size_t size =
+        S_ISREG(status.st_mode) && status.st_size <= off_t{OpenMetricsText::kLargestText}
+            ? static_cast<std::size_t>(status.st_size)
+            : 0;
+    const bool hasRoom = size <= room;
+    if (hasRoom) room -= size;
+    state = {0, status.st_dev, status.st_ino, status.st_size, nanoseconds(status.st_mtim), hasRoom};
   }
   const bool isSame = state == entry.state;
   if (isSame && entry.isSettled) return;
   if (!isSame) entry.complaint.clear();
   entry.state = state;
   entry.isSettled = state.error != 0 || now() - state.changedAt > kTimeStep;
+  if (!state.hasRoom) {
+    isChanged_ |= std::exchange(entry.isGood, false);
+    entry.hash.reset();
+    entry.channels = {};
+    entry.values = {};
+    return complain(file,
+                    ": the files before it and this are larger than " + std::to_string(kMostBytes) +
+                        " bytes" + kLeftOut,
+                    entry);
+  }
 
   const SmallFile content = readSmallFile(directory, file.c_str(), OpenMetricsText::kLargestText);
   const std::size_t hash = std::hash<std::string>()(content.text);

@@ -19,11 +19,14 @@ namespace halvox::platform::linux_ {
 
 // What other daemons count and write as metrics into the files *.prom of one directory. A file that
 // is wrong, too large or no file is left out as a whole, with one line in the log for each change
-// of it. A file that did not change costs a look at its size and times. Files in the order of their
-// names; of a channel that two files tell the first file's counts.
+// of it, and so are the files for which no room is left. A file that did not change costs a look at
+// its size and times. Files in the order of their names; of a channel that two files tell the first
+// file's counts.
 class TextfileSource final : public DriverSource {
  public:
   static constexpr std::size_t kMostFiles = 1000;
+  // Of all files together, as what they tell is kept.
+  static constexpr std::size_t kMostBytes = 8U << 20U;
 
   explicit TextfileSource(std::filesystem::path directory) : directory_(std::move(directory)) {}
 
@@ -40,6 +43,7 @@ class TextfileSource final : public DriverSource {
     ino_t inode = 0;
     off_t size = 0;
     std::int64_t changedAt = 0;  // nanoseconds since 1970
+    bool hasRoom = true;
     friend bool operator==(const State&, const State&) = default;
   };
   struct Entry {
@@ -54,7 +58,7 @@ class TextfileSource final : public DriverSource {
     std::uint64_t round = 0;
   };
 
-  void readEntry(int directory, const std::string& file, Entry& entry);
+  void readEntry(int directory, const std::string& file, std::size_t& room, Entry& entry);
   void take(std::vector<MetricChannel>&& channels, Entry& entry);
   void complain(const std::string& file, const std::string& what, Entry& entry);
   [[nodiscard]] std::vector<std::string> list(int directory);

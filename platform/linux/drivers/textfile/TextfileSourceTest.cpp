@@ -72,6 +72,30 @@ TEST_F(TextfileSourceTest, AFileThatIsWrittenInPlaceIsNoticedEvenWithinOneTick) 
   }
 }
 
+TEST_F(TextfileSourceTest, FilesForWhichNoRoomIsLeftAreLeftOutUntilThereIs) {
+  // Each as large as a file may be, so that all of them take the whole room.
+  for (int number = 0; number < 8; ++number) {
+    const std::string name = "level" + std::to_string(number);
+    std::string text = "# TYPE " + name + " gauge\n" + name + " 5\n";
+    for (int line = 0; text.size() < OpenMetricsText::kLargestText; ++line) {
+      const std::string help = "# HELP other" + std::to_string(line) + " ";
+      const std::size_t left = OpenMetricsText::kLargestText - text.size();
+      text += help + std::string(left < 400 ? left - help.size() - 1 : 100, 'x') + "\n";
+    }
+    write(name + ".prom", text);
+  }
+  writePulses("z.prom", 3);
+
+  EXPECT_THAT(show(), SizeIs(8));
+  EXPECT_THAT(show(), SizeIs(8));
+  EXPECT_THAT(errors(),
+              ElementsAre(complaint(
+                  "z.prom", ": the files before it and this are larger than 8388608 bytes")));
+
+  std::filesystem::remove(directory_.path() / "level3.prom");
+  EXPECT_THAT(show(), ::testing::Contains("-/Haptics/-/pulses  = 3"));
+}
+
 TEST_F(TextfileSourceTest, AWrongFileIsLeftOutAndNamedOnceWithItsLine) {
   writePulses("a.prom", 3);
   write("b.prom", "# TYPE x counter\nx_total -1\n");
