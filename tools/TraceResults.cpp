@@ -5,6 +5,7 @@
 #include <cmath>
 #include <cstring>
 #include <fstream>
+#include <limits>
 
 #include <rapidjson/document.h>
 #include <rapidjson/istreamwrapper.h>
@@ -124,7 +125,9 @@ void writeTraceEvents(const TraceResults& results, std::ostream& out) {
     double start = 0;
     for (const double value : values) {
       writeInterval(json, track, name, start, value);
-      start += value;
+      // JSON has no infinity.
+      start = std::clamp(start + value, std::numeric_limits<double>::lowest(),
+                         std::numeric_limits<double>::max());
     }
   }
   json.EndArray();

@@ -77,5 +77,16 @@ TEST_F(TraceResultsTest, IntervalsOfOneNameStandOneBehindTheOther) {
   EXPECT_EQ(events[5]["dur"].GetDouble(), 0.5);
 }
 
+TEST_F(TraceResultsTest, IntervalsThatAddUpToMoreThanANumberHoldsAreStillJson) {
+  std::ostringstream out;
+
+  writeTraceEvents({.product = "P", .values = {{"a", {1.7e308, 1.7e308, 1}}}}, out);
+
+  rapidjson::Document document;
+  document.Parse(out.str().c_str());
+  ASSERT_TRUE(document.IsObject());
+  EXPECT_EQ(document["traceEvents"].Size(), 5U);  // two names, three intervals
+}
+
 }  // namespace
 }  // namespace halvox::tools
