@@ -1,8 +1,9 @@
 #!/usr/bin/env bash
-# Runs every fuzz target from its kept seeds, sharing that many seconds evenly.
+# Runs every fuzz target from its kept seeds, two at a time, sharing that many seconds of processor
+# time evenly.
 # fuzz.sh DIRECTORY-OF-TARGETS SECONDS
 set -euo pipefail
-bin=$1
+bin=$(realpath "$1")
 seconds=$2
 cd "$(dirname "$0")/../.."
 
@@ -11,13 +12,17 @@ mapfile -t targets < <(find tests/fuzz/seeds -mindepth 1 -maxdepth 1 -type d -pr
 each=$((seconds / ${#targets[@]}))
 scratch=$(mktemp -d)
 trap 'rm -rf "$scratch"' EXIT
-for target in "${targets[@]}"; do
-  echo "fuzz: $target for $each s"
-  mkdir -p "$scratch/$target"
-  if ! "$bin/$target" -max_total_time="$each" -timeout=10 -rss_limit_mb=1024 -artifact_prefix="$scratch/" \
-    "$scratch/$target" "tests/fuzz/seeds/$target" >"$scratch/log" 2>&1; then
-    tail -n 60 "$scratch/log"
-    exit 1
+
+run_target() {
+  local target=$1 found=$scratch/$1
+  mkdir "$found"
+  if ! "$bin/$target" -max_total_time="$each" -timeout=10 -rss_limit_mb=1024 \
+    -artifact_prefix="$scratch/$target-" "$found" "tests/fuzz/seeds/$target" >"$found.log" 2>&1; then
+    tail -n 60 "$found.log"
+    return 1
   fi
-  grep -E '^(stat::|Done|#[0-9]+.*DONE)' "$scratch/log" | tail -n 2
-done
+  echo "fuzz: $target: $(grep -E '^Done' "$found.log")"
+}
+export -f run_target
+export bin each scratch
+printf '%s\0' "${targets[@]}" | xargs -0 -n 1 -P 2 bash -c 'run_target "$1"' _
