@@ -1,37 +1,15 @@
 #include "platform/linux/settings/PreferenceWriting.h"
 
-#include <csignal>
-
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include "platform/linux/settings/SettingsTestSupport.h"
+#include "platform/linux/testing/FileSizeLimit.h"
 
 namespace halvox::platform::linux_ {
 namespace {
-
-// What is written beyond so many bytes of a file fails, as on a full disk.
-class FilesMayNotGrow {
- public:
-  explicit FilesMayNotGrow(rlim_t bytes) {
-    ::getrlimit(RLIMIT_FSIZE, &old_);
-    const rlimit limit{bytes, old_.rlim_max};
-    ::setrlimit(RLIMIT_FSIZE, &limit);
-  }
-  FilesMayNotGrow(const FilesMayNotGrow&) = delete;
-  FilesMayNotGrow& operator=(const FilesMayNotGrow&) = delete;
-  ~FilesMayNotGrow() {
-    ::setrlimit(RLIMIT_FSIZE, &old_);
-    std::signal(SIGXFSZ, signal_);
-  }
-
- private:
-  rlimit old_{};
-  void (*signal_)(int) = std::signal(SIGXFSZ, SIG_IGN);
-};
 
 class PreferenceWritingTest : public SettingsTest {
  protected:
@@ -107,7 +85,7 @@ TEST_F(PreferenceWritingTest, ALinkToAFileThatIsMissingStaysALinkToo) {
 TEST_F(PreferenceWritingTest, AFailedWriteLeavesTheOldFileAndNothingElse) {
   write(file_, "a = 1\n");
   const auto error = [this] {
-    const FilesMayNotGrow limit(8);
+    const FileSizeLimit limit(8);
     return changePreferenceFile(file_, to("a = \"much too long\"\n"));
   }();
 
