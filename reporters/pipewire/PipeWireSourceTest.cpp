@@ -148,10 +148,23 @@ TEST_F(PipeWireSourceTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItRe
 }
 
 TEST_F(PipeWireSourceTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
+  // What all reports so far say was lost, in seconds.
+  const auto silence = [this] {
+    double sum = 0;
+    for (const auto& call : client.calls()) {
+      if (call.operation == "playback-issue") {
+        sum += call.dictionary.find(kSilenceKey)->toDouble();
+      }
+    }
+    return sum;
+  };
   const ChildProcess player = play(20);
   ASSERT_TRUE(waitFor("volume"));
   iterateFor(std::chrono::seconds(1));
-  ASSERT_THAT(client.operations(), testing::Not(testing::Contains("playback-issue")));
+  // A busy machine misses cycles by itself, but never long.
+  const double before = silence();
+  const auto reportsBefore = std::ranges::count(client.operations(), "playback-issue");
+  EXPECT_LT(before, 0.5);
 
   player.signal(SIGSTOP);
   const auto stopped = steady_clock::now();
@@ -160,17 +173,11 @@ TEST_F(PipeWireSourceTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
   const std::chrono::duration<double> pause = steady_clock::now() - stopped;
   iterateFor(std::chrono::seconds(2));
 
-  double silence = 0;
-  for (const auto& call : client.calls()) {
-    if (call.operation == "playback-issue") {
-      silence += call.dictionary.find(kSilenceKey)->toDouble();
-    }
-  }
   EXPECT_EQ(client.last("playback-issue").find(kIssueTypeKey)->string(), "xrun");
   EXPECT_EQ(client.last("playback-issue").find(kNodeKey)->string(), "pw-play");
   EXPECT_EQ(client.last("playback-issue").find(kIssueClientKey)->string(), "pw-play");
-  EXPECT_NEAR(silence, pause.count(), 0.5);
-  EXPECT_LE(std::ranges::count(client.operations(), "playback-issue"), 4);
+  EXPECT_NEAR(silence() - before, pause.count(), 0.5);
+  EXPECT_LE(std::ranges::count(client.operations(), "playback-issue") - reportsBefore, 4);
 }
 
 TEST_F(PipeWireSourceTest, SleepsWhileThereIsNoStreamThoughThereIsAProfiler) {
