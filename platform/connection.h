@@ -29,8 +29,9 @@ struct Error {
 // The wire has room for one answer: a second call is dropped and logged at debug level.
 using ReplyCallback = std::function<void(const std::optional<Error>&, const Value&)>;
 
-// What a client's requests made the service hold on to. Written on the reporting queue, read by the
-// connection's thread before it delivers a request.
+// What a client's requests made the service hold on to: what its sessions keep, and messages that
+// wait, from the delivery of their request on. Read by the connection's thread before it delivers a
+// request.
 struct ResourceUse {
   std::uint64_t bytes = 0;
   std::uint64_t sessions = 0;
@@ -41,7 +42,7 @@ struct ResourceUse {
 class ExportedObject {
  public:
   virtual ~ExportedObject() = default;
-  // What this client's sessions hold now. Called on the connection's thread; never blocks.
+  // What is held for this client now. Called on the connection's thread; never blocks.
   [[nodiscard]] virtual ResourceUse resourceUse() const { return {}; }
 };
 
@@ -56,8 +57,8 @@ struct Invocation {
   ReplyCallback reply;  // never empty; does nothing when the client wants no answer
 };
 
-// Whether a request can make the service hold more. Such requests are refused while the client's
-// sessions hold too many bytes; those that make a session also while it has too many of these.
+// Whether a request can make the service hold more. Such requests are refused while too many bytes
+// are held for the client; those that make a session also while it has too many of these.
 enum class MethodEffect : std::uint8_t { kMayHoldMore, kHoldsNoMore, kMakesSession };
 
 // One method of an interface: its name, the D-Bus signatures of what goes in and out, and the

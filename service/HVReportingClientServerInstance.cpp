@@ -65,7 +65,9 @@ HVReportingClientServerInstance::Session HVReportingClientServerInstance::findRe
 }
 
 // The job holds the client, so that requests of a connection that has ended are carried out, and
-// the request's token, so that the connection knows how much of its work is open.
+// the request's token, so that the connection knows how much of its work is open. Requests that
+// bring a dictionary charge it from here on: the next request of the client finds in the account
+// what this one will make the service hold.
 template <typename Work>
 void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight, Work work) {
   counters().received.add();
@@ -101,10 +103,12 @@ void HVReportingClientServerInstance::getServiceNameForReporterID(ReporterID rep
 
 void HVReportingClientServerInstance::setConfiguration(platform::Dictionary configuration,
                                                        ReporterID reporterID, BoolReply reply) {
-  queueRequest(platform::JobWeight::kBrief, [configuration = std::move(configuration), reporterID,
-                                             reply = std::move(reply)](auto& client) {
-    client.carryOutSetConfiguration(configuration, reporterID, reply);
-  });
+  ResourceCharge charge(account_, configuration.memorySize());
+  queueRequest(platform::JobWeight::kBrief,
+               [configuration = std::move(configuration), reporterID, reply = std::move(reply),
+                charge = std::move(charge)](auto& client) {
+                 client.carryOutSetConfiguration(configuration, reporterID, reply);
+               });
 }
 
 void HVReportingClientServerInstance::startReportingSessionForID(ReporterID reporterID,
@@ -118,9 +122,10 @@ void HVReportingClientServerInstance::startReportingSessionForID(ReporterID repo
 void HVReportingClientServerInstance::sendMessage(platform::Message message,
                                                   AudioEventCategory category, AudioEventType type,
                                                   ReporterIDs reporterIDs, ErrorReply reply) {
+  ResourceCharge charge(account_, message ? message->memorySize() : 0);
   queueRequest(platform::JobWeight::kBrief,
                [request = MessageRequest{std::move(message), category, type, std::move(reporterIDs),
-                                         senderProcessName(), std::move(reply)}](
+                                         senderProcessName(), std::move(reply), std::move(charge)}](
                    auto& client) mutable { client.carryOutSend(request); });
 }
 

@@ -87,6 +87,7 @@ class HVReportingClientServerInstance final
     ReporterIDs reporterIDs;
     ProcessName senderProcessName;
     ErrorReply reply;
+    ResourceCharge charge;  // for the message, until the request was carried out
   };
   struct SenderName {
     platform::ProcessID pid = 0;

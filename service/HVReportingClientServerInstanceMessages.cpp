@@ -103,7 +103,7 @@ void HVReportingClientServerInstance::sendToNamedSessions(const MessageRequest& 
     const Session session = findReportingSessionForID(reporterID, Lookup::kAcrossAllClients);
     if (session == nullptr) continue;
     handToBackEnds(request, session, delegate);
-    session->sendMessage(request.message, request.category, request.type, nullptr);
+    session->sendMessage(request.message, request.category, request.type, nullptr, account_);
     delivered = true;
   }
   (delivered ? counters().delivered : counters().noSession).add();
@@ -122,7 +122,7 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
   // Here the session comes before the back-ends, and for named sessions after them. Both orders are
   // intended.
   for (const Session& session : sessions) {
-    session->sendMessage(request.message, request.category, request.type, nullptr);
+    session->sendMessage(request.message, request.category, request.type, nullptr, account_);
     handToBackEnds(request, session, delegate);
   }
 }
@@ -139,14 +139,14 @@ void HVReportingClientServerInstance::sendStandalone(const MessageRequest& reque
   kServiceLog.notice("no active reporting sessions found, sending as standalone");
   HVReportingSession::sendSingleMessage(request.message, request.category, request.type,
                                         AudioServiceType::kStandalone, delegate->getDefaults(),
-                                        nullptr);
+                                        nullptr, account_);
 }
 
 // Each back-end decides by itself whether the message concerns it.
 void HVReportingClientServerInstance::handToBackEnds(const MessageRequest& request,
                                                      const Session& session,
                                                      const Delegate& delegate) {
-  const auto& [message, category, type, ids, senderName, reply] = request;
+  const auto& [message, category, type, ids, senderName, reply, charge] = request;
   HVReportingTallyhubBridge::handleEvent(message, category, type, session);
   HVReportingJoulebookUtility::handleEvent(message, category, type, session);
   HVReportingZUBBridge::handleEvent(message, category, type, session);

@@ -35,9 +35,7 @@ HVReportingSession::~HVReportingSession() {
   if (transactionCompleteBlock_.take()) startRepliesDropped().add();
 }
 
-void HVReportingSession::chargeTo(std::shared_ptr<ResourceAccount> account) {
-  account_ = std::move(account);
-}
+void HVReportingSession::chargeTo(Account account) { account_ = std::move(account); }
 
 void HVReportingSession::charge(std::size_t before, std::size_t after) {
   if (account_ == nullptr) return;

@@ -46,6 +46,7 @@ class HVReportingSession : public platform::KQTraceSessionDelegate,
                            public std::enable_shared_from_this<HVReportingSession> {
  public:
   using ProcessIdentifiers = std::vector<platform::ProcessID>;
+  using Account = std::shared_ptr<ResourceAccount>;
   // The history, locked: there is one exactly while the session is started.
   using HistoryLock = Guarded<std::optional<MessageHistory>>::Lock;
 
@@ -56,7 +57,7 @@ class HVReportingSession : public platform::KQTraceSessionDelegate,
 
   // From now on what the session holds is charged to that account, until the session is gone. At
   // most once, before anything else is done with the session.
-  void chargeTo(std::shared_ptr<ResourceAccount> account);
+  void chargeTo(Account account);
 
   [[nodiscard]] ReporterID reporterID() const { return reporterID_; }
   // Processes of the owner; the first is reported as the owner.
@@ -170,16 +171,21 @@ class HVReportingSession : public platform::KQTraceSessionDelegate,
 
   // Records a message in the history unless it repeats the one before it of its category and type.
   // `sync` is accepted and has no effect. The reply, when there is one, is called with none before
-  // this returns.
+  // this returns. While the message waits to go out over the link, it is charged to `sender`, the
+  // client that sent it, which need not be the session's; without one to the session's account.
   void sendMessage(const platform::Message& message, AudioEventCategory category,
-                   AudioEventType type, bool sync, const ErrorReply& reply);
+                   AudioEventType type, bool sync, const ErrorReply& reply,
+                   const Account& sender = nullptr);
   void sendMessage(const platform::Message& message, AudioEventCategory category,
-                   AudioEventType type, const ErrorReply& reply);
+                   AudioEventType type, const ErrorReply& reply, const Account& sender = nullptr);
   // Sends one message outside any session, one second later, on a background queue; there the
-  // reply, when there is one, is called. `userInfo` is accepted and not used.
+  // reply, when there is one, is called. `userInfo` is accepted and not used. Until then the
+  // message is charged to `sender`, who is not refused here: a message that came this far was
+  // answered. Without a sender nobody is charged.
   static void sendSingleMessage(const platform::Message& message, AudioEventCategory category,
                                 AudioEventType type, AudioServiceType serviceType,
-                                const platform::Dictionary& userInfo, const ErrorReply& reply);
+                                const platform::Dictionary& userInfo, const ErrorReply& reply,
+                                const Account& sender = nullptr);
 
   // The message history of the current run, and the lock of all bookkeeping of identifiers.
   [[nodiscard]] HistoryLock nestedAggregatedPayloadData() const { return history_.lock(); }
@@ -205,7 +211,7 @@ class HVReportingSession : public platform::KQTraceSessionDelegate,
     AudioEventType type{};
     bool wasStarted = false;
     bool isRedundant = false;
-    std::size_t bytes = 0;  // charged while it waits
+    Account sender{};  // who is charged while it waits; null: nobody
   };
   void submitLinkStart();
   void startLink(const LinkStart& start);
@@ -220,7 +226,7 @@ class HVReportingSession : public platform::KQTraceSessionDelegate,
     tlmReportingSessionStarted_.store(started, std::memory_order_release);
   }
   void submitToLink(LinkMessage message);
-  [[nodiscard]] std::size_t bytesOf(const LinkMessage& message) const;
+  [[nodiscard]] static std::size_t bytesOf(const LinkMessage& message);
   void sendThroughLink(const LinkMessage& message);
   void sendAsSingleMessage(const LinkMessage& message);
 
@@ -247,7 +253,7 @@ class HVReportingSession : public platform::KQTraceSessionDelegate,
   const ReporterID reporterID_;
   // Signalled when a trace of the framework has completed.
   const std::shared_ptr<platform::DispatchSemaphore> mTraceDispatchSemaphore_;
-  std::shared_ptr<ResourceAccount> account_;  // null: nobody is charged
+  Account account_;                           // null: nobody is charged
   std::atomic<std::size_t> chargedBytes_{0};  // orders with nothing: the sum of what was charged
   Guarded<ProcessIdentifiers> processIdentifiers_;
   Guarded<platform::Dictionary> configuration_;

@@ -107,13 +107,10 @@ HVReportingSession::tlmreportingBackendSemaphore() {
 // messages are: starting and stopping again and again takes no more than a client may hold.
 void HVReportingSession::submitLinkStart() {
   LinkStart start{serviceType(), serviceName(), configuration()};
-  const std::size_t bytes = kWaitingOverhead + start.configuration.memorySize();
-  charge(0, bytes);
+  ResourceCharge charge(account_, kWaitingOverhead + start.configuration.memorySize());
   tlmReportingQueue()->async(JobWeight::kMayBlock,
-                             [session = shared_from_this(), start = std::move(start), bytes] {
-                               session->startLink(start);
-                               session->charge(bytes, 0);
-                             });
+                             [session = shared_from_this(), start = std::move(start),
+                              charge = std::move(charge)] { session->startLink(start); });
 }
 
 void HVReportingSession::startLink(const LinkStart& start) {
@@ -171,11 +168,11 @@ void HVReportingSession::dropLink() {
 }
 
 void HVReportingSession::submitLinkStop() {
-  charge(0, kWaitingOverhead);
-  tlmReportingQueue()->async(JobWeight::kMayBlock, [session = shared_from_this()] {
-    session->stopLink();
-    session->charge(kWaitingOverhead, 0);
-  });
+  tlmReportingQueue()->async(
+      JobWeight::kMayBlock,
+      [session = shared_from_this(), charge = ResourceCharge(account_, kWaitingOverhead)] {
+        session->stopLink();
+      });
 }
 
 void HVReportingSession::stopLink() {
@@ -202,14 +199,15 @@ void HVReportingSession::endLinkStop() {
 }
 
 // Messages wait here while the link is being opened or its servers are slow. What waits is charged
-// to the client, whose further requests are refused at its bound: so nothing that was accepted is
-// lost, and what the queues hold is bounded by what clients may hold.
+// to the client that sent it, whose further requests are refused at its bound: so nothing that was
+// accepted is lost, what the queues hold is bounded by what clients may hold, and the owner of a
+// session does not pay for what others send to it.
 void HVReportingSession::submitToLink(LinkMessage message) {
   counters().received.add();
-  message.bytes = bytesOf(message);
-  charge(0, message.bytes);
+  ResourceCharge charge(message.sender, message.sender == nullptr ? 0 : bytesOf(message));
   tlmReportingQueue()->async(
-      JobWeight::kMayBlock, [session = shared_from_this(), message = std::move(message)] {
+      JobWeight::kMayBlock,
+      [session = shared_from_this(), message = std::move(message), charge = std::move(charge)] {
         kSessionLog.debug(
             "entering tlmreporting "
             "-[HVReportingSession sendMessage:category:type:sync:reply:]_block_invoke");
@@ -218,12 +216,10 @@ void HVReportingSession::submitToLink(LinkMessage message) {
         } else {
           session->sendAsSingleMessage(message);
         }
-        session->charge(message.bytes, 0);
       });
 }
 
-std::size_t HVReportingSession::bytesOf(const LinkMessage& message) const {
-  if (account_ == nullptr) return 0;
+std::size_t HVReportingSession::bytesOf(const LinkMessage& message) {
   std::size_t bytes = kWaitingOverhead + message.tagged.memorySize();
   if (!message.original.has_value()) return bytes;
   // The tagged message shares all values of the original, unless some were replaced in it.
@@ -261,7 +257,7 @@ void HVReportingSession::sendAsSingleMessage(const LinkMessage& message) {
   kSessionLog.debug("session not started, will send as a single message");
   counters().single.add();
   sendSingleMessage(message.tagged, message.category, message.type, serviceType(), configuration(),
-                    nullptr);
+                    nullptr, message.sender);
 }
 
 }  // namespace halvox

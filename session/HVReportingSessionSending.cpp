@@ -39,12 +39,14 @@ bool isExemptFromSuppression(AudioEventCategory category, AudioEventType type) {
 }  // namespace
 
 void HVReportingSession::sendMessage(const platform::Message& message, AudioEventCategory category,
-                                     AudioEventType type, const ErrorReply& reply) {
-  sendMessage(message, category, type, false, reply);
+                                     AudioEventType type, const ErrorReply& reply,
+                                     const Account& sender) {
+  sendMessage(message, category, type, false, reply, sender);
 }
 
 void HVReportingSession::sendMessage(const platform::Message& message, AudioEventCategory category,
-                                     AudioEventType type, bool /*sync*/, const ErrorReply& reply) {
+                                     AudioEventType type, bool /*sync*/, const ErrorReply& reply,
+                                     const Account& sender) {
   kSessionLog.debug("sending message for session owned by ", number(reporterID_));
   const Dictionary tagged = HVReportingUtilityAddAudioMessageTag(
       HVReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(Dictionary())), category, type);
@@ -57,7 +59,8 @@ void HVReportingSession::sendMessage(const platform::Message& message, AudioEven
                   .category = category,
                   .type = type,
                   .wasStarted = wasStarted,
-                  .isRedundant = isRedundant});
+                  .isRedundant = isRedundant,
+                  .sender = sender != nullptr ? sender : account_});
   }
   if (reply) reply(std::nullopt);
 }

@@ -1,4 +1,3 @@
-#include <atomic>
 #include <chrono>
 #include <optional>
 #include <random>
@@ -22,18 +21,15 @@ using platform::Dictionary;
 constexpr std::chrono::seconds kSingleMessageDelay{1};
 constexpr std::int64_t kNoLinkSession = -1;  // the framework's session ID outside any session
 constexpr int kMaxAlarmDelta = 59;
-// What may wait for its second at once, in bytes of messages. A flood past it is dropped.
-constexpr std::size_t kMaxPendingBytes = std::size_t{32} * 1024 * 1024;
 // What a waiting message costs beside its content, about: the job and its timer.
 constexpr std::size_t kPendingOverhead = 256;
 
-// received = sent + failed + suppressed + dropped + those that wait for their second.
+// received = sent + failed + suppressed + those that wait for their second.
 struct SingleMessageCounters {
   platform::Counter& received;
   platform::Counter& sent;
   platform::Counter& failed;
   platform::Counter& sampled;
-  platform::Counter& tooManyWaiting;
 };
 
 const SingleMessageCounters& counters() {
@@ -41,40 +37,8 @@ const SingleMessageCounters& counters() {
   platform::StatisticsService& statistics = platform::statistics();
   static const SingleMessageCounters made{
       statistics.counter(kPiece, "received"), statistics.counter(kPiece, "sent"),
-      statistics.counter(kPiece, "failed"), statistics.counter(kPiece, "suppressed: sampled"),
-      statistics.counter(kPiece, "dropped: too many waiting")};
+      statistics.counter(kPiece, "failed"), statistics.counter(kPiece, "suppressed: sampled")};
   return made;
-}
-
-// The bytes of all single messages that wait for their second. Any thread.
-class PendingBytes {
- public:
-  // A token that keeps the bytes counted as long as it lives; null when there is no room.
-  std::shared_ptr<void> tryAdd(std::size_t bytes) {
-    if (bytes_.fetch_add(bytes, std::memory_order_relaxed) + bytes > kMaxPendingBytes) {
-      remove(bytes);
-      return nullptr;
-    }
-    return {this, [bytes](PendingBytes* pending) { pending->remove(bytes); }};
-  }
-  // True for the first refusal since there was room again for many messages.
-  bool isNewBurst() { return !inBurst_.exchange(true, std::memory_order_relaxed); }
-
- private:
-  void remove(std::size_t bytes) {
-    const std::size_t left = bytes_.fetch_sub(bytes, std::memory_order_relaxed) - bytes;
-    if (left < kMaxPendingBytes / 2) inBurst_.store(false, std::memory_order_relaxed);
-  }
-
-  // They order with nothing: the bound may be missed by what other threads add at that moment.
-  std::atomic<std::size_t> bytes_{0};
-  std::atomic<bool> inBurst_{false};
-};
-
-PendingBytes& pendingBytes() {
-  // Never destroyed: jobs that did not run hold tokens when the process ends.
-  static auto* instance = new PendingBytes;
-  return *instance;
 }
 
 // Alarms go off everywhere at the same moment, hence the idea of spreading their messages. The
@@ -136,35 +100,25 @@ void sendNow(const SingleMessage& single, const ErrorReply& reply) {
   if (reply) reply(error);
 }
 
-void refuse(const ErrorReply& reply) {
-  counters().tooManyWaiting.add();
-  if (pendingBytes().isNewBurst()) {
-    kSessionLog.error("too many single messages are waiting, dropping some");
-  }
-  if (reply) reply(platform::Error{.description = "too many single messages are waiting"});
-}
-
 }  // namespace
 
 void HVReportingSession::sendSingleMessage(const platform::Message& message,
                                            AudioEventCategory category, AudioEventType type,
                                            AudioServiceType serviceType,
                                            const platform::Dictionary& /*userInfo*/,
-                                           const ErrorReply& reply) {
+                                           const ErrorReply& reply, const Account& sender) {
   counters().received.add();
   kSessionLog.debug("sending single message after delta ", drawDelta(serviceType), " for service ",
                     number(serviceType));
-  std::shared_ptr<void> place =
-      pendingBytes().tryAdd(kPendingOverhead + (message ? message->memorySize() : 0));
-  if (place == nullptr) {
-    refuse(reply);
-    return;
-  }
+  // Any number of messages may wait: what a client has waiting is bounded by what may be held for
+  // it, and its requests are refused at that bound, before they are answered. A bound here could
+  // only drop what was answered already, and that of other clients too.
+  ResourceCharge charge(sender, kPendingOverhead + (message ? message->memorySize() : 0));
   // The job runs in a small pool that all share, and blocks nobody: the framework waits for no
   // server.
   platform::dispatch().asyncAfterOnBackgroundQueue(
       kSingleMessageDelay, [single = SingleMessage{message, category, type, serviceType}, reply,
-                            place = std::move(place)] { sendNow(single, reply); });
+                            charge = std::move(charge)] { sendNow(single, reply); });
 }
 
 }  // namespace halvox

@@ -182,30 +182,46 @@ TEST_F(HVReportingSessionSingleMessageTest, AFailureWithoutAnErrorIsSilentAndRep
   EXPECT_THAT(replies, ElementsAre(std::nullopt));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, AFloodIsDroppedPastABoundAndLoggedOnce) {
+TEST_F(HVReportingSessionSingleMessageTest, AnyNumberMayWaitAndAllGoOut) {
   const Dictionary large{{"a", std::string(1024 * 1024, 'x')}};
-  std::vector<std::optional<platform::Error>> replies;
-  const ErrorReply reply = [&](const auto& error) { replies.push_back(error); };
 
-  for (int round = 0; round < 40; ++round) send(AudioServiceType::kHaptics, large, reply);
-
-  const auto dropped = platform_.statistics.value("single messages", "dropped: too many waiting");
-  EXPECT_EQ(platform_.dispatch.delayedJobs() + dropped, 40U);
-  EXPECT_GE(dropped, 8U);
-  EXPECT_EQ(replies.size(), dropped);
-  EXPECT_TRUE(std::ranges::all_of(replies, [](const auto& error) { return error.has_value(); }));
-  EXPECT_THAT(platform_.log.texts(LogLevel::kError),
-              ElementsAre("too many single messages are waiting, dropping some"));
-}
-
-TEST_F(HVReportingSessionSingleMessageTest, ThereIsRoomAgainAfterAFlood) {
-  const Dictionary large{{"a", std::string(1024 * 1024, 'x')}};
-  for (int round = 0; round < 40; ++round) send(AudioServiceType::kHaptics, large);
+  for (int round = 0; round < 100; ++round) send(AudioServiceType::kHaptics, large);
+  EXPECT_EQ(platform_.dispatch.delayedJobs(), 100U);
   platform_.dispatch.advance(1s);
 
-  send(AudioServiceType::kHaptics, large);
+  EXPECT_EQ(platform_.tlmReporting.singleMessages().size(), 100U);
+  EXPECT_THAT(platform_.log.texts(LogLevel::kError), IsEmpty());
+}
 
-  EXPECT_EQ(platform_.dispatch.delayedJobs(), 1U);
+TEST_F(HVReportingSessionSingleMessageTest, IsChargedToItsSenderUntilTheFrameworkTookIt) {
+  const auto sender = std::make_shared<ResourceAccount>();
+  std::uint64_t whenTaken = 0;
+  const ErrorReply reply = [&](const auto&) { whenTaken = sender->use().bytes; };
+
+  HVReportingSession::sendSingleMessage(Dictionary{{"a", std::string(1000, 'x')}},
+                                        AudioEventCategory::kPlayback, AudioEventType::kStart,
+                                        AudioServiceType::kHaptics, {}, reply, sender);
+  const std::uint64_t whileWaiting = sender->use().bytes;
+  platform_.dispatch.advance(1s);
+
+  EXPECT_GE(whileWaiting, 1000U);
+  EXPECT_EQ(whenTaken, whileWaiting);
+  EXPECT_EQ(sender->use().bytes, 0U);
+}
+
+TEST_F(HVReportingSessionSingleMessageTest, GoesOutWhenItsSenderHasGone) {
+  auto sender = std::make_shared<ResourceAccount>();
+  const std::weak_ptr<ResourceAccount> watched = sender;
+  HVReportingSession::sendSingleMessage(Dictionary{{"a", 1}}, AudioEventCategory::kPlayback,
+                                        AudioEventType::kStart, AudioServiceType::kHaptics, {},
+                                        nullptr, sender);
+
+  sender.reset();
+  EXPECT_FALSE(watched.expired());
+  platform_.dispatch.advance(1s);
+
+  EXPECT_EQ(platform_.tlmReporting.singleMessages().size(), 1U);
+  EXPECT_TRUE(watched.expired());
 }
 
 }  // namespace

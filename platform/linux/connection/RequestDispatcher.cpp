@@ -104,8 +104,9 @@ void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& m
   arguments_.clear();
 }
 
-// Requests that were read and are not carried out yet are not in the sums, so a client can pass a
-// bound by what those make it hold.
+// The bytes of a request count from its delivery on, so a client can pass that bound by what one
+// request makes it hold. Sessions count once they are made: requests that were read and are not
+// carried out yet can make some more than the bound.
 bool RequestDispatcher::isOverLimits(const Request& request, const InterfaceMethod& method) {
   const ResourceUse use = request.client.exportedObject()->resourceUse();
   const std::uint64_t maxBytes = options_.clientHistoryMegabytes * kMiB;
@@ -113,7 +114,8 @@ bool RequestDispatcher::isOverLimits(const Request& request, const InterfaceMeth
     request.client.refuse(
         request.header(), Refusal::kHistoryLimit, error_names::kLimitsExceeded,
         "client_history_megabytes = " + std::to_string(options_.clientHistoryMegabytes) +
-            " is reached: the client's sessions hold " + std::to_string(use.bytes) + " bytes");
+            " is reached: " + std::to_string(use.bytes) +
+            " bytes are held for the client, in its sessions and in messages that wait");
     return true;
   }
   if (method.effect == MethodEffect::kMakesSession && use.sessions >= options_.clientSessions) {

@@ -1,0 +1,87 @@
+#include <chrono>
+#include <memory>
+#include <string>
+#include <utility>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "session/LinkTest.h"
+
+// Who pays for messages that wait to go out over the link.
+namespace halvox::link_test {
+namespace {
+
+using namespace std::chrono_literals;
+
+class HVReportingSessionLinkChargesTest : public LinkTest {
+ protected:
+  HVReportingSessionLinkChargesTest() { session_->chargeTo(owner_); }
+
+  void sendFromAnother() {
+    session_->sendMessage(Dictionary{{"a", std::string(1000, 'x')}}, kPlayback, kStart, nullptr,
+                          sender_);
+  }
+
+  const std::shared_ptr<ResourceAccount> owner_ = std::make_shared<ResourceAccount>();
+  const std::shared_ptr<ResourceAccount> sender_ = std::make_shared<ResourceAccount>();
+};
+
+TEST_F(HVReportingSessionLinkChargesTest, ASingleMessageOfAnotherClientIsChargedToThatOne) {
+  sendFromAnother();
+  EXPECT_GE(sender_->use().bytes, 1000U) << "in the queue of the link";
+  run();
+  EXPECT_GE(sender_->use().bytes, 1000U) << "for its second";
+  EXPECT_EQ(owner_->use().bytes, 0U);
+  platform_.dispatch.advance(1s);
+
+  EXPECT_EQ(sender_->use().bytes, 0U);
+  EXPECT_EQ(framework_.singleMessages().size(), 1U);
+}
+
+TEST_F(HVReportingSessionLinkChargesTest, OwnersPayForTheHistoryAndSendersForWhatWaits) {
+  holdDiscoveries();
+  start();
+
+  sendFromAnother();
+  const std::size_t history = (*session_->nestedAggregatedPayloadData())->memorySize();
+  EXPECT_GE(sender_->use().bytes, 1000U);
+  EXPECT_EQ(owner_->use().bytes, history);
+  framework_.answerDiscovery(kServers);
+  run();
+
+  EXPECT_EQ(sender_->use().bytes, 0U);
+  EXPECT_EQ(owner_->use().bytes, history);
+}
+
+TEST_F(HVReportingSessionLinkChargesTest, MessagesOfTheSessionItselfAreChargedToItsOwner) {
+  holdDiscoveries();
+  start();
+  send({{"a", 1}});
+
+  session_->stop();  // its summary and its end wait now, and the history is gone
+  EXPECT_GT(owner_->use().bytes, 0U);
+  framework_.answerDiscovery(kServers);
+  run();
+
+  EXPECT_EQ(owner_->use().bytes, 0U);
+}
+
+TEST(ResourceChargeTest, IsPaidForAsLongAsItOrACopyLives) {
+  const auto account = std::make_shared<ResourceAccount>();
+  {
+    ResourceCharge charge(account, 100);
+    EXPECT_EQ(account->use().bytes, 100U);
+    ResourceCharge copy = charge;
+    EXPECT_EQ(account->use().bytes, 200U);
+    const ResourceCharge moved = std::move(charge);
+    EXPECT_EQ(account->use().bytes, 200U);
+    copy = ResourceCharge(account, 7);
+    EXPECT_EQ(account->use().bytes, 107U);
+  }
+
+  EXPECT_EQ(account->use().bytes, 0U);
+}
+
+}  // namespace
+}  // namespace halvox::link_test
