@@ -8,9 +8,10 @@ import re
 import shutil
 import signal
 import subprocess
+import unittest
 from pathlib import Path
 
-from harness import BIN, DEADLINE, Service, WITH_US, wait_for
+from harness import BIN, DEADLINE, Service, WITH_US, require, wait_for
 
 CLIENT = BIN / "halvox_trace_client"
 NOBODY = 65534
@@ -25,6 +26,15 @@ def give_up_root():
         os.setgroups([])
         os.setgid(NOBODY)
         os.setuid(NOBODY)
+
+
+def require_tracer():
+    """Gives up being root, and skips the module when the build or the machine cannot record."""
+    require("lttng-sessiond", "lttng", "babeltrace2")
+    give_up_root()
+    with TracedService() as service:
+        if not service.has_tracer():
+            raise unittest.SkipTest("LTTng is not in this build")
 
 
 def interval(name, begin, end, matched_by="Thread"):

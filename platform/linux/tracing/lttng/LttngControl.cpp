@@ -2,9 +2,7 @@
 
 #include <algorithm>
 #include <bit>
-#include <cstdlib>
 #include <cstring>
-#include <memory>
 #include <span>
 #include <system_error>
 #include <utility>
@@ -14,6 +12,7 @@
 #include <unistd.h>
 
 #include "platform/linux/UniqueHandle.h"
+#include "platform/linux/tracing/lttng/TracerSessions.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -104,30 +103,13 @@ std::string LttngControl::namePrefix() const {
   return "halvox-" + std::to_string(status.st_dev) + "-" + std::to_string(status.st_ino) + "-";
 }
 
-std::vector<std::string> LttngControl::sessionNames() {
-  lttng_session* sessions = nullptr;
-  const int count = ::lttng_list_sessions(&sessions);
-  const std::unique_ptr<lttng_session, decltype(&std::free)> owner(sessions, &std::free);
-  std::vector<std::string> names;
-  if (count > 0) names.reserve(static_cast<std::size_t>(count));
-  for (int index = 0; index < count; ++index) names.emplace_back(sessions[index].name);
-  return names;
-}
-
-void LttngControl::destroyOurSessions() {
-  const std::string prefix = namePrefix();
-  for (const std::string& name : sessionNames()) {
-    if (name.starts_with(prefix)) static_cast<void>(::lttng_destroy_session_no_wait(name.c_str()));
-  }
-}
-
 void LttngControl::removeLeftovers() {
   const MutexLock lock(mutex_);
   std::error_code ignored;
   const bool isRecorded = std::filesystem::exists(scratchDirectory_, ignored);
   if (!isRecorded && !daemon_.isNoted()) return;
-  daemon_.adopt();
-  if (::lttng_session_daemon_alive() == 1) destroyOurSessions();
+  daemon_.adopt(namePrefix());
+  if (::lttng_session_daemon_alive() == 1) destroyTracerSessions(namePrefix());
   std::filesystem::remove_all(scratchDirectory_, ignored);
 }
 
@@ -140,7 +122,7 @@ LttngControl::Failure LttngControl::begin(const RecordingPlan& plan, Recording& 
   std::filesystem::create_directories(recording.directory, error);
   if (error) return "cannot make " + recording.directory.string() + ": " + error.message();
   if (::lttng_session_daemon_alive() != 1) {
-    if (auto failure = daemon_.start()) return failure;
+    if (auto failure = daemon_.start(namePrefix())) return failure;
   }
   return setUp(plan, recording);
 }
@@ -178,11 +160,13 @@ void LttngControl::discard(const Recording& recording) {
 void LttngControl::close() {
   const MutexLock lock(mutex_);
   if (begun_ == 0 && !daemon_.isOurs()) return;
-  const bool isAlive = ::lttng_session_daemon_alive() == 1;
-  if (isAlive) destroyOurSessions();
+  if (daemon_.isOurs()) {
+    daemon_.leave();
+  } else if (::lttng_session_daemon_alive() == 1) {
+    destroyTracerSessions(namePrefix());
+  }
   std::error_code ignored;
   std::filesystem::remove_all(scratchDirectory_, ignored);
-  if (!isAlive || sessionNames().empty()) daemon_.end();
 }
 
 }  // namespace halvox::platform::linux_

@@ -59,8 +59,6 @@ class LttngControl {
   [[nodiscard]] std::string namePrefix() const;
   [[nodiscard]] Failure setUp(const RecordingPlan& plan, const Recording& recording)
       HALVOX_REQUIRES(mutex_);
-  void destroyOurSessions() HALVOX_REQUIRES(mutex_);
-  static std::vector<std::string> sessionNames();
 
   const std::filesystem::path tracesDirectory_;
   const std::filesystem::path scratchDirectory_;

@@ -5,14 +5,16 @@
 #include <optional>
 #include <string>
 
-#include <sys/types.h>
+#include "platform/linux/tracing/lttng/DaemonProcess.h"
+#include "platform/linux/tracing/lttng/TracerKeeper.h"
 
 namespace halvox::platform::linux_ {
 
 // The session daemon of LTTng, when it was started by us. Belongs to one thread at a time.
 //
-// A file tells which process it is, so that a service that starts again after it was killed knows
-// its daemon too. A process is signalled only while its start time is the one that was noted.
+// It ends with the service, however that ends, unless sessions of others are in it: its keeper sees
+// to that. A file tells which process it is, so that a service that starts later knows a daemon
+// that others used. A process is signalled only while its start time is the one that was noted.
 class SessionDaemon {
  public:
   struct Limits {
@@ -25,31 +27,32 @@ class SessionDaemon {
   SessionDaemon(std::filesystem::path noteFile, Limits limits)
       : noteFile_(std::move(noteFile)), limits_(limits) {}
 
-  // Takes over the daemon that the file names, if it still runs; otherwise the file goes.
-  void adopt();
+  // Takes over the daemon that the file names, if it still runs; otherwise the file goes. Waits for
+  // the keeper of an earlier service that is still at work. Our sessions have names that start with
+  // `ownSessions`.
+  void adopt(const std::string& ownSessions = {});
   [[nodiscard]] bool isNoted() const;
   // Ends the daemon that was ours and does not answer any more, starts another and waits until it
   // answers; or ends it and tells why not.
-  [[nodiscard]] std::optional<std::string> start();
+  [[nodiscard]] std::optional<std::string> start(const std::string& ownSessions = {});
   [[nodiscard]] bool isOurs() const { return process_.has_value(); }
   // Ends the daemon, if it is ours, and waits until it is gone.
   void end();
+  // Has our sessions destroyed, and the daemon ended unless sessions of others are in it. Waits
+  // until that is done. The daemon is not ours any more.
+  void leave();
 
  private:
-  struct Process {
-    pid_t pid = 0;
-    std::string startTime;  // as the kernel tells it
-    bool isChild = false;
-  };
-
-  [[nodiscard]] static std::string startTimeOf(pid_t pid);
-  [[nodiscard]] bool isAlive() const;
-  [[nodiscard]] bool isGoneSoon() const;
-  void note() const;
+  [[nodiscard]] std::chrono::milliseconds keeperEndsWithin() const {
+    return limits_.answersWithin + 2 * limits_.endsWithin;
+  }
+  void forget();
 
   const std::filesystem::path noteFile_;
   const Limits limits_;
-  std::optional<Process> process_;
+  std::string ownSessions_;
+  std::optional<DaemonProcess> process_;
+  TracerKeeper keeper_;
 };
 
 }  // namespace halvox::platform::linux_

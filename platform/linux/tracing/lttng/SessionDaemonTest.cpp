@@ -49,6 +49,26 @@ class SessionDaemonTest : public testing::Test {
     for (int number = 0; number < 22; ++number) file >> field;
     return field;
   }
+  // The keeper that was started last; 0 when none runs.
+  static pid_t keeper() {
+    pid_t found = 0;
+    for (const auto& entry : fs::directory_iterator("/proc")) {
+      std::ifstream file(entry.path() / "stat");
+      pid_t pid = 0;
+      pid_t parent = 0;
+      std::string name;
+      std::string state;
+      if (file >> pid >> name >> state >> parent && parent == ::getpid() &&
+          name.starts_with("(halvox-tracer") && state != "Z") {
+        found = pid;
+      }
+    }
+    return found;
+  }
+  void noteAndAdopt(pid_t process) {
+    std::ofstream(note_) << process << ' ' << startTimeOf(process) << '\n';
+    daemon_.adopt();
+  }
   // A process of ours that waits to be ended.
   static pid_t startSleeper() {
     const pid_t child = ::fork();
@@ -119,6 +139,42 @@ TEST_F(SessionDaemonTest, DaemonThatWasNotedIsKnownAgainAndEnded) {
   int status = 0;
   ASSERT_EQ(::waitpid(sleeper, &status, 0), sleeper);
   EXPECT_TRUE(WIFSIGNALED(status) && WTERMSIG(status) == SIGTERM);
+}
+
+TEST_F(SessionDaemonTest, DaemonThatIsLeftIsEndedByItsKeeper) {
+  const pid_t sleeper = startSleeper();
+  noteAndAdopt(sleeper);
+
+  daemon_.leave();
+
+  EXPECT_FALSE(daemon_.isOurs());
+  EXPECT_FALSE(daemon_.isNoted());
+  EXPECT_EQ(keeper(), 0);
+  EXPECT_EQ(::waitpid(sleeper, nullptr, WNOHANG), sleeper);
+}
+
+TEST_F(SessionDaemonTest, KeeperThatWasKilledIsReplaced) {
+  const pid_t sleeper = startSleeper();
+  noteAndAdopt(sleeper);
+  ASSERT_GT(keeper(), 1);
+  ::kill(keeper(), SIGKILL);
+
+  daemon_.leave();
+
+  EXPECT_FALSE(daemon_.isNoted());
+  EXPECT_EQ(::waitpid(sleeper, nullptr, WNOHANG), sleeper);
+}
+
+TEST_F(SessionDaemonTest, KeeperDoesNotHeedTheSignalsOfATerminal) {
+  const pid_t sleeper = startSleeper();
+  noteAndAdopt(sleeper);
+  const pid_t first = keeper();
+  for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGQUIT}) ::kill(first, signal);
+
+  EXPECT_EQ(keeper(), first);
+  daemon_.leave();
+
+  EXPECT_EQ(::waitpid(sleeper, nullptr, WNOHANG), sleeper);
 }
 
 TEST_F(SessionDaemonTest, DaemonThatDoesNotAnswerAnyMoreIsEndedBeforeAnotherIsStarted) {

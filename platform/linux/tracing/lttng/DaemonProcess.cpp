@@ -1,0 +1,104 @@
+#include "platform/linux/tracing/lttng/DaemonProcess.h"
+
+#include <csignal>
+#include <fstream>
+#include <iterator>
+#include <thread>
+
+#include <fcntl.h>
+#include <spawn.h>
+#include <unistd.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::chrono::milliseconds kLookEvery{10};  // at a process that tells nobody
+
+std::string startTimeOf(pid_t pid) {
+  std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
+  std::string text((std::istreambuf_iterator<char>(file)), {});
+  // The name, which may hold anything, ends at the last bracket; the start time is the 22nd field.
+  const std::size_t name = text.rfind(')');
+  if (name == std::string::npos) return {};
+  constexpr int kFieldsBetween = 20;
+  std::size_t at = name;
+  for (int field = 0; field < kFieldsBetween && at != std::string::npos; ++field) {
+    at = text.find(' ', at + 1);
+  }
+  if (at == std::string::npos || text.compare(name, 3, ") Z") == 0) return {};
+  return text.substr(at + 1, text.find(' ', at + 1) - at - 1);
+}
+
+void addStream(posix_spawn_file_actions_t& actions, int ours, int theirs) {
+  if (ours >= 0) {
+    ::posix_spawn_file_actions_adddup2(&actions, ours, theirs);
+  } else {
+    ::posix_spawn_file_actions_addopen(&actions, theirs, "/dev/null", O_RDWR, 0);
+  }
+}
+
+}  // namespace
+
+DaemonProcess DaemonProcess::withNumber(pid_t pid) {
+  return {.pid = pid, .startTime = startTimeOf(pid)};
+}
+
+std::optional<DaemonProcess> DaemonProcess::read(const std::filesystem::path& noteFile) {
+  DaemonProcess process;
+  std::ifstream file(noteFile);
+  if (!(file >> process.pid >> process.startTime) || process.pid <= 1) return std::nullopt;
+  return process;
+}
+
+bool DaemonProcess::write(const std::filesystem::path& noteFile) const {
+  std::ofstream file(noteFile);
+  file << pid << ' ' << startTime << '\n';
+  file.close();
+  return !file.fail();
+}
+
+bool DaemonProcess::isAlive() const { return !startTime.empty() && startTimeOf(pid) == startTime; }
+
+void DaemonProcess::end(std::chrono::milliseconds within) const {
+  for (const int signal : {SIGTERM, SIGKILL}) {
+    if (isAlive()) ::kill(pid, signal);
+    const auto deadline = std::chrono::steady_clock::now() + within;
+    while (isAlive() && std::chrono::steady_clock::now() < deadline) {
+      std::this_thread::sleep_for(kLookEvery);
+    }
+    if (!isAlive()) return;
+  }
+}
+
+int startApart(const ProgramApart& program, pid_t& pid) {
+  posix_spawn_file_actions_t actions;
+  ::posix_spawn_file_actions_init(&actions);
+  addStream(actions, program.input, STDIN_FILENO);
+  addStream(actions, program.output, STDOUT_FILENO);
+  addStream(actions, -1, STDERR_FILENO);
+  posix_spawnattr_t attributes;
+  ::posix_spawnattr_init(&attributes);
+  // Our threads block all signals and the service ignores some; other programs expect neither.
+  sigset_t signals;
+  ::sigemptyset(&signals);
+  if (program.endSignals == ProgramApart::EndSignals::kBlocked) {
+    for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGQUIT}) ::sigaddset(&signals, signal);
+  }
+  ::posix_spawnattr_setsigmask(&attributes, &signals);
+  ::sigfillset(&signals);
+  ::posix_spawnattr_setsigdefault(&attributes, &signals);
+  constexpr int kFlags = POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSID;
+  ::posix_spawnattr_setflags(&attributes, kFlags);
+  std::vector<std::string> words = program.command;
+  std::vector<char*> arguments;
+  arguments.reserve(words.size() + 1);
+  for (std::string& word : words) arguments.push_back(word.data());
+  arguments.push_back(nullptr);
+  const int error =
+      ::posix_spawnp(&pid, arguments[0], &actions, &attributes, arguments.data(), environ);
+  ::posix_spawnattr_destroy(&attributes);
+  ::posix_spawn_file_actions_destroy(&actions);
+  return error;
+}
+
+}  // namespace halvox::platform::linux_
