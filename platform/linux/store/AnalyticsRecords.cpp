@@ -11,7 +11,8 @@ namespace {
 
 constexpr UnitLog kLog{storeCategory, "AnalyticsRecords"};
 
-// A burst's memory is given back; what an ordinary round needs is kept.
+// Memory for this many events is kept between rounds: as many as the queue's soft limit. A burst
+// that needed more gives its memory back.
 constexpr std::size_t kKeptEvents = 8192;
 
 SqliteCode prepareAll(Database& database,
@@ -78,7 +79,8 @@ SqliteCode AnalyticsRecords::write(TransactionAllowance& allowance) {
   return spans_.flush();
 }
 
-// Builds the payload of a taken event and lets go of its builder and all that it holds.
+// Builds the payload of a taken event. Frees the builder with the message that it holds, so that
+// memory shrinks while a large batch is written.
 Dictionary AnalyticsRecords::build(std::size_t index) {
   const AnalyticsPayloadBuilder builder = std::exchange(taken_[index].builder, nullptr);
   return builder ? builder() : Dictionary();

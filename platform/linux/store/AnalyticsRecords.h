@@ -17,16 +17,18 @@
 
 namespace halvox::platform::linux_ {
 
-// The analytics events of the store. Two events in a row whose payloads are equal, as each message
-// makes them, share one record: the payload is encoded and stored once.
-// Any thread may add; the rest is called by the writer.
+// The analytics events of the store. Every message makes two events with equal payloads. When two
+// consecutive events of one batch have the same payload, they share a record: the payload is
+// encoded and stored once. Events of one message that fall into two batches get a record each.
+// Threads, owner and failures are those of RecordKind.
 class AnalyticsRecords final : public RecordKind {
  public:
-  // Does not own its arguments, which must outlive it. `longestPayload` in bytes.
+  // Does not own its arguments, which must outlive it. `longestPayload` is in bytes.
   AnalyticsRecords(EventNames& names, WriterQueue& queue, StatisticsService& statistics,
                    std::uint64_t longestPayload);
 
-  // Queues an event of that time (seconds since 1970). Waits while the queue is full.
+  // Any thread. Queues an event with its time (seconds since 1970). Waits while the queue is full;
+  // counts the event as dropped when the store is closed.
   void add(double time, std::string_view name, AnalyticsPayloadBuilder builder);
 
   [[nodiscard]] SqliteCode prepare(Database& database) override;
@@ -48,7 +50,7 @@ class AnalyticsRecords final : public RecordKind {
   struct Event {
     double time;
     EventName* name;
-    std::unique_ptr<EventName> ownName;  // the name, when the table had no room for it
+    std::unique_ptr<EventName> ownName;  // owns the name if the table of names was full
     AnalyticsPayloadBuilder builder;
   };
   struct Statements {
@@ -68,21 +70,22 @@ class AnalyticsRecords final : public RecordKind {
   RecordCounters counters_;
   const std::uint64_t longestPayload_;
 
-  std::vector<Event> queued_;  // under the queue's lock
+  std::vector<Event> queued_;  // guarded by the lock of the WriterQueue
 
-  // The writer's. Events before next_ are written, and their memory is given back.
+  // Used by the writer's thread only. Events before next_ are written, and their builders freed.
   std::vector<Event> taken_;
   std::size_t next_ = 0;
   PayloadEncoder encoder_;
-  Dictionary lookedAhead_;  // the payload of the next event, when it was built for comparison
+  Dictionary lookedAhead_;  // the payload of the next event, built to compare it
   bool hasLookedAhead_ = false;
   Statements statements_;
   RecordSpans spans_{"analytics_records", "analytics_spans"};
-  // Names that a failed transaction or a lost database had numbered are numbered anew.
+  // Increases when the numbers of names may have become wrong: after a rollback, which may have
+  // undone their rows, and with a new connection, whose database may be another.
   std::uint64_t generation_ = 1;
-  std::uint64_t written_ = 0;       // events of the open transaction
-  std::uint64_t writtenBytes_ = 0;  // and their payloads
-  std::uint64_t tooLarge_ = 0;      // of them not stored
+  std::uint64_t written_ = 0;       // events in the open transaction, those too large included
+  std::uint64_t writtenBytes_ = 0;  // the length of their payloads
+  std::uint64_t tooLarge_ = 0;      // events among written_ that were dropped for their length
   OncePerSecond tooLargeLines_;
 };
 

@@ -16,8 +16,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The log is written a moment before the commit in it shows, and only the writing is announced: so
-// the follower looks again so many times, so far apart.
+// inotify reports the write to the log, but readers see the commit only a moment later, and that is
+// not reported. After each report the follower therefore looks three more times, 25 ms apart.
 constexpr int kLooksAgain = 3;
 constexpr long kLookAgainNanoseconds = 25'000'000;
 
@@ -28,10 +28,10 @@ StoreError systemFailure(const std::filesystem::path& directory) {
   const auto kind = errno == ENOENT || errno == ENOTDIR ? StoreError::Kind::kMissing
                                                         : StoreError::Kind::kCannotOpen;
   return {kind, directory.native() +
-                    ": the directory cannot be watched: " + std::system_category().message(errno)};
+                    ": cannot watch the directory: " + std::system_category().message(errno)};
 }
 
-// The shared memory beside the database is left out: reading changes it too.
+// The -shm file does not count: readers write to it too, and the follower would wake itself.
 bool isStoreFile(std::string_view name) {
   return name.starts_with(kStoreFileName) && !name.ends_with("-shm");
 }
@@ -47,7 +47,7 @@ std::optional<StoreError> EventFollower::open(const std::filesystem::path& direc
   timer_.reset(::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC));
   watch_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (!poller_ || !timer_ || !watch_) return systemFailure(directory);
-  // Before anything is read, so that no event falls between reading and watching.
+  // Watch before the first read. A record stored between the two would otherwise go unnoticed.
   if (::inotify_add_watch(watch_.get(), directory.c_str(), kWatched) < 0) {
     return systemFailure(directory);
   }
@@ -102,8 +102,9 @@ std::optional<StoreError> EventFollower::deliverBy(Read read) {
   return error;
 }
 
-// The database was replaced: its numbers begin anew. Until there is another, nothing is open. One
-// that is just being made may be refused for any reason, so only the last look's error counts.
+// Opens the database that took the place of the old one; its record IDs start from 1. `isOpen` is
+// false while there is none. A database that is still being created can fail in any way, so an
+// error counts only when no look remains.
 std::optional<StoreError> EventFollower::reopen(bool& isOpen) {
   auto error = reader_.open(directory_);
   isOpen = !error.has_value();

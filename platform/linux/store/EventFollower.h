@@ -9,29 +9,34 @@
 
 namespace halvox::platform::linux_ {
 
-// Delivers the records of one kind of a store as they come, for as long as its owner likes:
-// survives that the service ends, starts again or begins a new database. Belongs to one thread;
-// sleeps without a timer while nothing is written.
+// Follows a store: delivers the records of one kind as the service stores them, each once. Keeps
+// following when the service ends, starts again or creates a new database. Belongs to one thread
+// and one owner. Sets a timer only after the store was written to, so that a quiet store causes no
+// wake-ups.
 //
-//   open(); deliver(); then, each time that descriptor() is readable: deliver()
+//   open(); deliver(); then call deliver() each time that descriptor() is readable
 class EventFollower {
  public:
-  // Begins to watch. The first delivery has what the filter lets through of what is stored already.
+  // Starts to watch the store in `directory`. The first deliver() has the records that are stored
+  // already and pass the filter. Fails as StoreReader::open() does, or with kCannotOpen or kMissing
+  // when the directory cannot be watched.
   [[nodiscard]] std::optional<StoreError> open(const std::filesystem::path& directory,
                                                const RecordFilter& filter);
-  // Readable (poll) when deliver() should be called. Owned by this object.
+  // Becomes readable (poll) when deliver() should be called. Owned by this object.
   [[nodiscard]] int descriptor() const { return poller_.get(); }
-  // Calls back for each event stored since the last delivery. Does not wait for any. An error ends
-  // the following: the directory is gone, or the database cannot be read.
+  // Calls `callback` on this thread for each event that was stored since the last delivery. Does
+  // not wait for events. Returns an error, after which following ends, when the directory was
+  // removed or the database cannot be read.
   [[nodiscard]] std::optional<StoreError> deliver(const StoreReader::EventCallback& callback);
-  // The same for the records of another kind. One follower follows one kind.
+  // The same for the records of another kind. Do not mix kinds in one follower: it remembers one
+  // position.
   [[nodiscard]] std::optional<StoreError> deliver(const RecordTable& table,
                                                   const StoreReader::RecordCallback& callback);
 
  private:
   enum class Change : unsigned char { kNone, kStoreWritten, kDirectoryGone };
 
-  // Reads what is new, after the last that was delivered, when there may be any.
+  // Calls `read` when there may be new records.
   template <typename Read>
   [[nodiscard]] std::optional<StoreError> deliverBy(Read read);
   [[nodiscard]] Change readChanges();

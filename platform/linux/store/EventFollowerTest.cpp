@@ -15,7 +15,7 @@ using ::testing::IsEmpty;
 
 class EventFollowerTest : public StoreTest {
  protected:
-  // Delivers until so many were seen in all; false after ten seconds.
+  // Delivers until `count` events were seen in all. Returns false after ten seconds.
   bool follow(std::size_t count) {
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
     while (std::chrono::steady_clock::now() < deadline) {
@@ -33,7 +33,7 @@ class EventFollowerTest : public StoreTest {
   std::vector<std::string> seen;
 };
 
-TEST_F(EventFollowerTest, BeginsWithWhatIsStoredAndGoesOnWithWhatComes) {
+TEST_F(EventFollowerTest, DeliversStoredEventsFirstThenNewOnes) {
   start();
   for (std::int64_t number = 0; number < 5; ++number) send(number);
   ASSERT_TRUE(allIsStored());
@@ -72,7 +72,7 @@ TEST_F(EventFollowerTest, AppliesItsFilterToWhatComes) {
   EXPECT_THAT(seen, ElementsAre(numbered(2)));
 }
 
-TEST_F(EventFollowerTest, GoesOnAfterTheServiceWasStartedAnew) {
+TEST_F(EventFollowerTest, ContinuesAfterARestartOfTheService) {
   start();
   ASSERT_EQ(follower.open(options.directory, {}), std::nullopt);
   send(1);
@@ -83,7 +83,7 @@ TEST_F(EventFollowerTest, GoesOnAfterTheServiceWasStartedAnew) {
   EXPECT_THAT(seen, ElementsAre(numbered(1), numbered(2)));
 }
 
-TEST_F(EventFollowerTest, GoesOnWithADatabaseThatTookThePlaceOfTheOld) {
+TEST_F(EventFollowerTest, ContinuesWithADatabaseThatReplacedTheOldOne) {
   start();
   ASSERT_EQ(follower.open(options.directory, {}), std::nullopt);
   send(1);

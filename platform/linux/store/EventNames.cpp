@@ -25,7 +25,7 @@ EventName* EventNames::find(std::string_view name) {
     EventName* present = slots_[index].load(std::memory_order_acquire);
     if (present == nullptr) {
       if (made == nullptr) {
-        // Threads that count past the bound together overshoot it by their number at most.
+        // Threads that test the bound at the same time may exceed it by their number at most.
         if (count_.load(std::memory_order_relaxed) >= kMostNames) return nullptr;
         made = std::make_unique<EventName>(name, matches(name));
       }
@@ -33,7 +33,7 @@ EventName* EventNames::find(std::string_view name) {
         count_.fetch_add(1, std::memory_order_relaxed);
         return made.release();
       }
-      // Another thread was first; its entry, now in `present`, may be the very name.
+      // Another thread set the slot first. Its entry is now in `present` and may have this name.
     }
     if (present->text == name) return present;
     index = (index + 1) % kSlots;

@@ -9,8 +9,9 @@
 
 namespace halvox::platform::linux_ {
 
-// One event name, made once and kept. `isWanted` is constant; the rest belongs to the store's
-// writer: the name's number in the database, good while the generations agree.
+// One event name. Any thread may read the constant members. The others are the name's row in the
+// database and belong to the store's writer; they are valid while `generation` is the one of
+// AnalyticsRecords.
 struct EventName {
   EventName(std::string_view name, bool wanted) : text(name), isWanted(wanted) {}
   const std::string text;
@@ -19,32 +20,37 @@ struct EventName {
   std::uint64_t generation = 0;
 };
 
-// The event names that were seen, each with the answer to whether somebody wants it. Any thread may
-// ask, without a lock: an entry is never changed or removed once it is in the table.
-// Bounded: a name that finds the table full is matched anew each time.
+// A table of the event names seen so far, each with the answer whether it is to be stored. Matching
+// the patterns for every message would be too slow. Owned by the store.
+//
+// Any thread may call, and no call takes a lock: entries are added but never removed, and their
+// constant members never change. The table is bounded, because clients choose names. A name that
+// does not fit is matched again each time.
 class EventNames {
  public:
-  // Glob patterns as fnmatch(3) understands them; a name is wanted when one of them matches.
+  // Patterns for fnmatch(3). A name is wanted when at least one of them matches.
   explicit EventNames(std::vector<std::string> wantedPatterns);
   EventNames(const EventNames&) = delete;
   EventNames& operator=(const EventNames&) = delete;
   ~EventNames();
 
-  // The entry of that name, made if there is room; null when the table is full.
+  // Returns the entry of a name and adds it if needed; null when the table is full. The table owns
+  // the entry, which lives as long as the table.
   [[nodiscard]] EventName* find(std::string_view name);
-  // Asks the patterns.
+  // Matches the name against the patterns, without the table.
   [[nodiscard]] bool matches(std::string_view name) const;
 
   static constexpr std::size_t kMostNames = 4096;
 
  private:
+  // Twice the names: half of the slots stay empty, which keeps a search short and makes it end.
   static constexpr std::size_t kSlots = 2 * kMostNames;
 
   const std::vector<std::string> wantedPatterns_;
-  // A slot is set once and its content read by whoever finds it: set with release, read with
-  // acquire.
+  // Each slot is set once. Storing with release and loading with acquire make the entry's content
+  // visible to every thread that finds it.
   std::unique_ptr<std::atomic<EventName*>[]> slots_;
-  // Orders with nothing; it only stops the growth.
+  // Bounds the growth. Relaxed: it orders with nothing.
   std::atomic<std::size_t> count_{0};
 };
 

@@ -9,7 +9,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-TEST(EventNamesTest, WantsWhatOneOfThePatternsMatches) {
+TEST(EventNamesTest, WantsNamesThatMatchOneOfThePatterns) {
   EventNames names({"com.tarno.halvox.*", "*.Stop"});
   EXPECT_TRUE(names.find("com.tarno.halvox.Session.Start")->isWanted);
   EXPECT_TRUE(names.find("com.tarno.haptics.Session.Stop")->isWanted);

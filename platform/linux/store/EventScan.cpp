@@ -92,7 +92,8 @@ bool EventScan::passes(const Event& event) {
   return event.id > after_ && isWithinTimes(filter_, event.time) && name(event.nameID).matches;
 }
 
-// Looked up one by one: there are few, and a service may add some between two pieces.
+// Names are looked up one by one and kept: there are few, and the service may add names between two
+// pieces. A name that cannot be read stays empty.
 const EventScan::Name& EventScan::name(std::int64_t nameID) {
   const auto known = names_.find(nameID);
   if (known != names_.end()) return known->second;

@@ -11,9 +11,11 @@
 
 namespace halvox::platform::linux_ {
 
-// One pass over the stored events that match a filter, in pieces, so that no snapshot is held
-// between them. Ends with what was stored when it began. Belongs to the thread of its database,
-// which it does not own.
+// One pass over the stored events that pass a filter. Reads in pieces, and holds no snapshot
+// between them: see StoreReader. Ends with the last event that was stored when it began. Belongs to
+// the thread of its database and does not own its arguments. After an error the scan is over.
+//
+// An event's ID is twice the number of its record, plus 1 for the twin.
 class EventScan {
  public:
   struct Event {
@@ -30,9 +32,9 @@ class EventScan {
   EventScan(Database& database, const RecordFilter& filter)
       : database_(database), filter_(filter), after_(filter.after) {}
 
-  // Finds where to begin and to end.
+  // Finds the first and the last record to read. Call once, before next().
   [[nodiscard]] SqliteCode begin();
-  // Reads on. A piece may be empty though more follow.
+  // Reads the next piece. An empty piece is not the end: more may follow until isAtEnd().
   [[nodiscard]] SqliteCode next(Piece& piece);
   [[nodiscard]] bool isAtEnd() const { return bounds_.first > bounds_.last; }
 
@@ -44,8 +46,8 @@ class EventScan {
     bool matches = false;
   };
 
-  // The event in the statement's row: 0 the record's first, 1 its twin. False when there is none
-  // or the filter does not let it through.
+  // Reads an event from the statement's row: 0 is the record's first event, 1 its twin. Returns
+  // false when there is none or it does not pass the filter.
   [[nodiscard]] bool readEvent(const Statement& row, int which, Event& event);
   [[nodiscard]] bool passes(const Event& event);
   [[nodiscard]] const Name& name(std::int64_t nameID);

@@ -11,9 +11,9 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::size_t kIndent = 2;
-constexpr std::size_t kObjectDepth = 2;  // of an object's own entries: the array, and its key
+constexpr std::size_t kObjectDepth = 2;  // of each object: it is in the array, and under its key
 
-// Where the string that begins at `begin` ends: behind its closing quote.
+// Returns the position after the closing quote of the string that begins at `begin`.
 std::size_t endOfString(std::string_view json, std::size_t begin) {
   std::size_t at = begin + 1;
   while (json[at] != '"') at += json[at] == '\\' ? 2 : 1;
@@ -40,14 +40,16 @@ class IndentedJsonArray::Text {
     isTaken_ = true;
     return text_;
   }
-  // Lets go of what was taken, before anything is added.
+  // Discards the text that was taken. Called before anything is added: until then the caller reads
+  // it.
   void begin() {
     if (isTaken_) text_.clear();
     isTaken_ = false;
   }
 
  private:
-  // Not by a Dictionary: keys that are different each time would fill the table of shared ones.
+  // Does not put the key into a Dictionary: Key shares its texts in a bounded table, which keys
+  // that differ each time would fill for the life of the process.
   void appendKey(std::string_view key) {
     key_.Clear();
     rapidjson::Writer<rapidjson::StringBuffer> writer(key_);
@@ -55,8 +57,9 @@ class IndentedJsonArray::Text {
     text_.append(key_.GetString(), key_.GetSize());
   }
 
-  // Adds compact JSON with line breaks. The text is the encoder's own and known to be well-formed;
-  // parsing it would take several times as long, and a session that is stopped waits for this.
+  // Appends compact JSON with line breaks and indents. Parsing would be slower and is not needed:
+  // the text comes from the encoder and is well-formed. Speed matters because the stop of a session
+  // waits for this, and every other request waits for the stop.
   void indent(std::string_view json) {
     std::size_t depth = kObjectDepth;
     for (std::size_t at = 0; at < json.size(); ++at) {

@@ -7,8 +7,9 @@
 
 namespace halvox::platform::linux_ {
 
-// A JSON array of objects as indented text, made piece by piece, so that it needs the memory of one
-// object at a time. Values have the form that PayloadEncoder gives them. Belongs to one thread.
+// Writes a JSON array of objects as indented text. The caller takes the text in pieces, so that an
+// array of any length needs the memory of one object. Values have the form that PayloadEncoder
+// documents. Belongs to one thread. Cannot fail.
 class IndentedJsonArray {
  public:
   IndentedJsonArray();
@@ -16,11 +17,12 @@ class IndentedJsonArray {
   IndentedJsonArray& operator=(const IndentedJsonArray&) = delete;
   ~IndentedJsonArray();
 
-  // Appends `{key: value}`, and the text before it. The key is UTF-8.
+  // Appends `{key: value}` and the separator before it. `key` must be UTF-8.
   void appendObject(std::string_view key, const Dictionary& value);
-  // Ends the array; nothing may be appended any more.
+  // Closes the array. Nothing may be appended after this.
   void end();
-  // What was appended since the text was taken last; valid until the next call.
+  // Returns the text that was appended since the last takeText(). Valid until the next call of any
+  // function.
   [[nodiscard]] std::string_view takeText();
 
  private:

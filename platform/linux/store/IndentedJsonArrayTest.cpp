@@ -67,7 +67,7 @@ TEST(IndentedJsonArrayTest, ValuesHaveTheFormOfPayloads) {
 )");
 }
 
-TEST(IndentedJsonArrayTest, SignsWithinStringsAreLeftAlone) {
+TEST(IndentedJsonArrayTest, PunctuationWithinStringsIsLeftAlone) {
   IndentedJsonArray json;
   json.appendObject("a{,}:", {{"b[\"", "{\"x\": [1,2]}\\"}, {"c", Array{Array{}, Dictionary{}}}});
   json.end();
@@ -86,7 +86,7 @@ TEST(IndentedJsonArrayTest, SignsWithinStringsAreLeftAlone) {
 )");
 }
 
-TEST(IndentedJsonArrayTest, KeysTakeNoPlaceInTheTableOfSharedOnes) {
+TEST(IndentedJsonArrayTest, KeysTakeNoRoomInTheTableOfSharedKeys) {
   IndentedJsonArray json;
   for (int number = 0; number < 100'000; ++number) {
     json.appendObject("one_of_many_keys_" + std::to_string(number), {});
@@ -96,7 +96,7 @@ TEST(IndentedJsonArrayTest, KeysTakeNoPlaceInTheTableOfSharedOnes) {
   EXPECT_TRUE(Key("a key that is new after many in an array").isInterned());
 }
 
-TEST(IndentedJsonArrayTest, PiecesThatAreTakenMakeTheSameText) {
+TEST(IndentedJsonArrayTest, PiecesTogetherMakeTheSameText) {
   IndentedJsonArray whole;
   IndentedJsonArray pieces;
   std::string text;
@@ -117,7 +117,7 @@ TEST(IndentedJsonArrayTest, PiecesThatAreTakenMakeTheSameText) {
   EXPECT_LT(longest, 100U);
 }
 
-TEST(IndentedJsonArrayTest, ManyNestedValuesAreNoDanger) {
+TEST(IndentedJsonArrayTest, DeeplyNestedValuesAreIndented) {
   Value nested(1);
   for (int depth = 0; depth < 60; ++depth) nested = Value(Array{nested});
   IndentedJsonArray json;

@@ -19,16 +19,18 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::size_t kKeptBufferBytes = 256 * 1024;
+// The shortest form of a double has at most 24 characters, an integer of 64 bits at most 20.
 constexpr std::size_t kLongestNumber = 32;
-constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
+constexpr std::string_view kReplacement = "\xEF\xBF\xBD";  // U+FFFD
 
-// Years beyond these have no RFC 3339 form.
+// RFC 3339 has four digits for the year. Both in seconds since 1970.
 constexpr double kEarliest = -62135596800.0;  // 0001-01-01
 constexpr double kEnd = 253402300800.0;       // 10000-01-01
 
 enum class TextKind : std::uint8_t { kPlain, kEscapesNeeded, kNotAscii };
 
-// Looks at eight bytes at a time, because nearly all texts are plain.
+// Tests eight bytes at a time: nearly all texts are plain, and are then copied without a second
+// look.
 TextKind classify(std::string_view text) {
   constexpr std::uint64_t kOnes = 0x0101010101010101U;
   constexpr std::uint64_t kHighs = kOnes * 0x80U;
@@ -38,7 +40,9 @@ TextKind classify(std::string_view text) {
     const std::uint64_t quotes = word ^ (kOnes * '"');
     const std::uint64_t backslashes = word ^ (kOnes * '\\');
     high |= word;
-    // Each term sets the high bit of a byte that is below 0x20, a quote or a backslash.
+    // Each line sets the high bit of a byte that is below 0x20, a quote or a backslash. The
+    // subtraction may also mark the byte above such a byte. That is harmless: only whether any
+    // byte is marked matters.
     special |= (word - kOnes * 0x20U) & ~word;
     special |= (quotes - kOnes) & ~quotes;
     special |= (backslashes - kOnes) & ~backslashes;
@@ -59,7 +63,7 @@ TextKind classify(std::string_view text) {
   return (special & kHighs) != 0 ? TextKind::kEscapesNeeded : TextKind::kPlain;
 }
 
-// The length of the well-formed UTF-8 sequence that `text` begins with, 0 when there is none.
+// Returns the length of the valid UTF-8 sequence at the beginning of `text`, or 0 without one.
 std::size_t sequenceLength(std::string_view text) {
   const auto byte = [&](std::size_t index) { return static_cast<unsigned char>(text[index]); };
   const unsigned char first = byte(0);
@@ -69,7 +73,7 @@ std::size_t sequenceLength(std::string_view text) {
   for (std::size_t index = 1; index < length; ++index) {
     if ((byte(index) & 0xC0U) != 0x80U) return 0;
   }
-  // Overlong forms, surrogates and what lies beyond the last code point show in the second byte.
+  // The second byte reveals overlong forms, surrogates and code points above U+10FFFF.
   const unsigned char second = byte(1);
   if (first == 0xE0U && second < 0xA0U) return 0;
   if (first == 0xEDU && second > 0x9FU) return 0;
@@ -89,9 +93,10 @@ std::string wellFormed(std::string_view text) {
   return result;
 }
 
-// "2023-11-14T22:13:20.250000Z" into `buffer`.
+// Writes a date as "2023-11-14T22:13:20.250000Z" into `buffer`.
 std::string_view dateText(double secondsSince1970, std::span<char, 64> buffer) {
   using namespace std::chrono;
+  // A date just before the end would be rounded up to the year 10000.
   const auto rounded = microseconds{std::llround(secondsSince1970 * 1e6)};
   const sys_time<microseconds> time{
       std::min(rounded, duration_cast<microseconds>(duration<double>(kEnd)) - microseconds(1))};
@@ -132,7 +137,7 @@ bool alikeNumbers(const Value& left, const Value& right) {
   switch (left.numberKind()) {
     case NumberKind::kFloat:
     case NumberKind::kDouble:
-      // Bit by bit, because 0.0 and -0.0 are equal but not the same text.
+      // Compare bits: 0.0 and -0.0 are equal but differ as text.
       return std::bit_cast<std::uint64_t>(left.toDouble()) ==
              std::bit_cast<std::uint64_t>(right.toDouble());
     case NumberKind::kUInt64:
@@ -172,8 +177,9 @@ bool alike(const Value& left, const Value& right) {
 
 }  // namespace
 
-// RapidJSON's writer with shorter ways for plain texts and for numbers, which it writes a character
-// at a time.
+// Extends RapidJSON's writer with faster code for plain texts and numbers: RapidJSON writes them
+// one character at a time. Derives from it because Prefix(), which keeps track of commas and
+// nesting, is protected.
 class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> {
  public:
   Text() { Reset(buffer_); }
@@ -250,6 +256,8 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
       case NumberKind::kBool:
         Bool(value.toBool());
         return;
+      // Not as a double: the shortest form of 0.1F is "0.1" as a float, and
+      // "0.10000000149011612" as a double.
       case NumberKind::kFloat:
         return addReal(static_cast<float>(value.toDouble()));
       case NumberKind::kDouble:

@@ -7,11 +7,16 @@
 
 namespace halvox::platform::linux_ {
 
-// Turns dictionaries into JSON text that always parses: dates are RFC 3339 text in UTC, data is
-// base64, no value is null, numbers have their shortest decimal form, numbers that JSON cannot hold
-// are the texts "NaN", "Infinity" and "-Infinity", a date outside the years 1 to 9999 is its number
-// of seconds since 1970, and bytes that are not UTF-8 are replaced by U+FFFD.
-// Belongs to one thread; keeps its buffer from one text to the next unless a text was very large.
+// Encodes dictionaries as compact JSON text that always parses, whatever a client has sent:
+//
+//   date             RFC 3339 text in UTC; outside the years 1 to 9999, its seconds since 1970
+//   data             base64
+//   no value         null
+//   number           the shortest decimal form that reads back as the same number
+//   NaN, infinities  the texts "NaN", "Infinity" and "-Infinity", which JSON has no numbers for
+//   text             as it is; each byte that is not part of valid UTF-8 becomes U+FFFD
+//
+// Belongs to one thread. Keeps its buffer between texts, unless a text was longer than 256 KiB.
 class PayloadEncoder {
  public:
   PayloadEncoder();
@@ -19,7 +24,7 @@ class PayloadEncoder {
   PayloadEncoder& operator=(const PayloadEncoder&) = delete;
   ~PayloadEncoder();
 
-  // The text; valid until the next call. Never fails.
+  // Returns the text, valid until the next call. Cannot fail.
   [[nodiscard]] std::string_view encode(const Dictionary& payload);
 
  private:
@@ -27,8 +32,9 @@ class PayloadEncoder {
   std::unique_ptr<Text> text_;
 };
 
-// Whether both give the same text, judged without making it. May say no where the texts are equal,
-// never yes where they differ: values that are equal as values can differ as text (1 and true).
+// Returns true only if both dictionaries encode to the same text, without encoding them. May
+// return false for equal texts; the store then writes the payload twice. Comparing the values with
+// == would be wrong: 1 and true are equal values with different texts.
 [[nodiscard]] bool encodeAlike(const Dictionary& left, const Dictionary& right);
 
 }  // namespace halvox::platform::linux_

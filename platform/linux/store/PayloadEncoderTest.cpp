@@ -34,7 +34,7 @@ TEST(PayloadEncoderTest, WritesBooleansAsBooleans) {
   EXPECT_EQ(encodeOne(false), R"({"k":false})");
 }
 
-TEST(PayloadEncoderTest, WritesIntegersToTheirEnds) {
+TEST(PayloadEncoderTest, WritesTheSmallestAndTheLargestIntegers) {
   EXPECT_EQ(encodeOne(std::numeric_limits<std::int64_t>::min()), R"({"k":-9223372036854775808})");
   EXPECT_EQ(encodeOne(std::numeric_limits<std::uint64_t>::max()), R"({"k":18446744073709551615})");
   EXPECT_EQ(encodeOne(std::int16_t{-7}), R"({"k":-7})");
@@ -70,7 +70,7 @@ TEST(PayloadEncoderTest, WritesTheFirstAndTheLastYearOfTheDateForm) {
   EXPECT_TRUE(encodeOne(Date{justBeforeTheEnd}).starts_with(R"({"k":"9999-12-31T23:59:59.)"));
 }
 
-TEST(PayloadEncoderTest, WritesDatesWithoutADateFormAsSeconds) {
+TEST(PayloadEncoderTest, WritesDatesOutsideTheFormAsSeconds) {
   EXPECT_EQ(encodeOne(Date{1e15}), R"({"k":1e+15})");
   EXPECT_EQ(encodeOne(Date{std::numeric_limits<double>::quiet_NaN()}), R"({"k":"NaN"})");
 }
@@ -89,7 +89,7 @@ TEST(PayloadEncoderTest, WritesContainersAndNoValue) {
   EXPECT_EQ(PayloadEncoder().encode({}), "{}");
 }
 
-TEST(PayloadEncoderTest, EscapesWhatEndsOrBreaksAText) {
+TEST(PayloadEncoderTest, EscapesQuotesBackslashesAndControlCharacters) {
   EXPECT_EQ(encodeOne("a\"b\\c"), R"({"k":"a\"b\\c"})");
   EXPECT_EQ(encodeOne(std::string("a\0b\n\x1F", 5)), R"({"k":"a\u0000b\n\u001F"})");
 }

@@ -9,8 +9,8 @@
 
 namespace halvox::platform::linux_ {
 
-// What became of the records of one kind: received = stored + dropped by reason + still waiting.
-// Any thread may count. Does not own the counters, which live as long as the process.
+// Counts the records of one kind: received = stored + dropped (by reason) + still waiting.
+// Any thread may count. The statistics service owns the counters and must outlive this object.
 class RecordCounters {
  public:
   RecordCounters(StatisticsService& statistics, std::string_view piece)

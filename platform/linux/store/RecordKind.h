@@ -8,39 +8,42 @@
 
 namespace halvox::platform::linux_ {
 
-// Why records were not stored. The texts of these are the names of the counters.
+// Why records were dropped instead of stored.
 enum class DropReason : std::uint8_t {
-  kDiskFull,
-  kLocked,
-  kLogHeld,
-  kDamaged,
-  kInputOutput,
-  kTooLarge,
-  kClosed,
+  kDiskFull,     // no space, over a quota, or over a limit on the size of files
+  kLocked,       // another process kept the database locked
+  kLogHeld,      // a reader keeps the write-ahead log from starting anew, and the log is full
+  kDamaged,      // the file turned out to be broken
+  kInputOutput,  // any other failure of SQLite or of the system
+  kTooLarge,     // the payload is longer than StoreSizes::payloadBytes
+  kClosed,       // the record came after SqliteStore::close()
 };
 constexpr std::size_t kDropReasons = 7;
+// The name under which the drops of that reason are counted, such as "dropped: disk full".
 [[nodiscard]] std::string_view counterName(DropReason reason);
 
-// What one transaction may still take.
+// How much the open transaction may still take.
 struct TransactionAllowance {
   std::int64_t records;
   std::int64_t payloadBytes;
   [[nodiscard]] bool isUsedUp() const { return records <= 0 || payloadBytes <= 0; }
 };
 
-// Records that the writer is done with, for its queue.
+// How many records left the queue, stored or dropped. WriterQueue::finish() needs to know.
 struct FinishedRecords {
-  std::uint64_t written = 0;
-  std::uint64_t writtenBytes = 0;  // their payloads
+  std::uint64_t written = 0;       // written into a transaction, committed or not
+  std::uint64_t writtenBytes = 0;  // the length of their payloads
   std::uint64_t unwritten = 0;     // dropped before they were written
 };
 
-// One kind of record of the store: its tables, the records of it that wait, and how they are
-// written and deleted. The store owns its kinds and calls them on the writer's thread.
+// One kind of record: its tables, its waiting records, and how they are written and deleted.
+// The store owns its kinds. The writer's thread calls all functions here; the derived classes have
+// a function to add records, which any thread may call. Functions that use the database return an
+// SQLite code; after an error the store rolls back and calls dropTaken().
 //
 //   queued --takeQueued--> taken --write--> written --onCommitted--> stored
 //                            |                 |
-//                            +----dropTaken----+--> dropped, counted with the reason
+//                            +----dropTaken----+--> dropped, counted under the reason
 class RecordKind {
  public:
   RecordKind() = default;
@@ -50,28 +53,30 @@ class RecordKind {
 
   // Prepares the statements, after each opening of the database.
   [[nodiscard]] virtual SqliteCode prepare(Database& database) = 0;
-  // Lets go of all statements, before each closing.
+  // Finalizes all statements, before each closing of the database.
   virtual void release() = 0;
 
-  // Moves what is queued to the writer's side, where nothing is left. Runs under the queue's lock.
+  // Moves the queued records to the writer's side, which must be empty. The caller holds the lock
+  // of the WriterQueue.
   virtual void takeQueued() = 0;
+  // Returns true while taken records wait to be written.
   [[nodiscard]] virtual bool hasTaken() const = 0;
 
-  // Writes taken records into the open transaction, in order, until none is left or the allowance
-  // is used up, which it reduces. After an error dropTaken() follows.
+  // Writes taken records into the open transaction, in order, until none remains or the allowance
+  // is used up. Subtracts from the allowance what it wrote.
   [[nodiscard]] virtual SqliteCode write(TransactionAllowance& allowance) = 0;
-  // The transaction's records are in the database. Adds them to the finished ones.
+  // Called after a successful commit. Counts the records as stored and adds them to `finished`.
   virtual void onCommitted(FinishedRecords& finished) = 0;
-  // The transaction failed: forgets its records and those that are taken but not written yet.
-  // Adds them to the finished ones and returns how many were dropped.
+  // Called after a failure. Drops the records of the transaction and the taken ones that are not
+  // yet written, counts them under the reason and adds them to `finished`. Returns their number.
   virtual std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) = 0;
 
-  // The time of the oldest record (seconds since 1970); none when there is none.
+  // Returns the time of the oldest record (seconds since 1970) in `time`, or std::nullopt without
+  // one.
   [[nodiscard]] virtual SqliteCode oldestTime(std::optional<double>& time) = 0;
 
-  // Delete some records in the open transaction: the oldest, or only such as are older than that
-  // (seconds since 1970). Without an error, `found` tells whether there were any; while it is true
-  // there may be more.
+  // Delete a few records in the open transaction: the oldest, or those older than `time` (seconds
+  // since 1970). `found` says whether there were any; call again while it is true.
   [[nodiscard]] virtual SqliteCode deleteOldest(bool& found) = 0;
   [[nodiscard]] virtual SqliteCode deleteOlderThan(double time, bool& found) = 0;
 };

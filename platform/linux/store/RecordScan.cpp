@@ -10,7 +10,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Columns of the statement that reads records; those of the table follow.
+// The columns of the statement that reads records. The columns of the RecordTable follow.
 enum Column : int { kID, kTime, kFirstColumn };
 
 constexpr int columnOf(std::size_t field) { return kFirstColumn + static_cast<int>(field); }

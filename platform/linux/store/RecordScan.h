@@ -11,38 +11,39 @@
 
 namespace halvox::platform::linux_ {
 
-// The numbers of the first and the last record that a filter's bounds let through; later ones may
-// still be older or younger than them.
+// The range of record numbers to read. All records that pass a filter are in it; not every record
+// in it passes.
 struct RecordBounds {
   std::int64_t first = 1;
   std::int64_t last = 0;
 };
 
-// Finds the bounds from the times of the spans, without looking at records. `bounds.first` is
-// given.
+// Narrows the bounds to the filter's times by means of the spans, without reading records. The
+// caller sets `bounds.first` to the first record that it may need.
 [[nodiscard]] SqliteCode findBounds(Database& database, const std::string& recordsTable,
                                     const std::string& spansTable, const RecordFilter& filter,
                                     RecordBounds& bounds);
 [[nodiscard]] bool isWithinTimes(const RecordFilter& filter, double time);
-// Whether one of the patterns matches, or there is none.
+// Returns true when at least one pattern matches, or there are no patterns.
 [[nodiscard]] bool matchesAny(const std::vector<std::string>& patterns, const std::string& name);
 
-// The bounds of one piece of a scan: what it holds, and how long it keeps its snapshot.
+// A piece of a scan ends at the first of these bounds. The first two bound its memory. The third
+// bounds the time that it holds a snapshot when few records pass the filter.
 constexpr std::size_t kRecordsPerPiece = 512;
 constexpr std::size_t kBytesPerPiece = 1U << 20U;
 constexpr int kLooksPerPiece = 50'000;
 
-// One pass over the records of one kind that match a filter, in pieces, so that no snapshot is held
-// between them. Ends with what was stored when it began. Belongs to the thread of its database,
-// which it does not own.
+// One pass over the records of one kind that pass a filter. Reads in pieces, and holds no snapshot
+// between them: see StoreReader. Ends with the last record that was stored when it began. Belongs
+// to the thread of its database and does not own its arguments. After an error the scan is over.
 class RecordScan {
  public:
   RecordScan(Database& database, const RecordTable& table, const RecordFilter& filter)
       : database_(database), table_(table), filter_(filter) {}
 
-  // Finds where to begin and to end.
+  // Finds the first and the last record to read. Call once, before next().
   [[nodiscard]] SqliteCode begin();
-  // Reads on. A piece may be empty though more follow.
+  // Reads the next piece. An empty piece is not the end: more may follow until isAtEnd().
   [[nodiscard]] SqliteCode next(std::vector<StoredRecord>& piece);
   [[nodiscard]] bool isAtEnd() const { return bounds_.first > bounds_.last; }
 

@@ -9,10 +9,11 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Few, because a single step may hold large payloads.
+// How many records deleteOldest() deletes. Few, because their payloads may be large, and retention
+// measures the free space after each step.
 constexpr std::int64_t kRecordsPerStep = 64;
 
-// The statement with the tables' names in the places of $records and $spans.
+// Returns the statement with the names of the tables in place of $records and $spans.
 std::string withTables(std::string_view sql, std::string_view records, std::string_view spans) {
   std::string result(sql);
   for (const auto& [place, name] :
@@ -38,7 +39,7 @@ SqliteCode RecordSpans::prepare(Database& database) {
             " last_time = max(last_time, excluded.last_time)"},
         {&statements_.oldestRecord, "SELECT id, time FROM $records ORDER BY id LIMIT 1"},
         {&statements_.deleteRecords, "DELETE FROM $records WHERE id BETWEEN ?1 AND ?2"},
-        // The newest span stays though its records are gone: it keeps record numbers growing.
+        // Keep the newest span when its records are gone: the next number derives from it.
         {&statements_.deleteEmptySpans,
          "DELETE FROM $spans WHERE span < ?1 AND span < (SELECT max(span) FROM $spans)"},
         {&statements_.agedSpan,
@@ -65,7 +66,8 @@ SqliteCode RecordSpans::readNext(Database& database) {
   if (code != SQLITE_ROW) return code;
   const std::int64_t newest = statement.integer(0);
   const std::int64_t span = statement.integer(1);
-  // When the newest span's records are gone, nobody knows how many of its numbers were given.
+  // If all records of the newest span were deleted, it is unknown how many of its numbers were
+  // used. Continue with the next span.
   const bool isUsedUp = span > newest / kRecordsPerSpan || (newest == 0 && span == 0);
   next_ = nextCommitted_ = isUsedUp ? (span + 1) * kRecordsPerSpan : newest + 1;
   span_ = {};
@@ -135,7 +137,9 @@ SqliteCode RecordSpans::deleteOlderThan(double time, bool& found) {
   statements_.deleteAgedRecords.bind(3, time);
   code = statements_.deleteAgedRecords.run();
   if (code != SQLITE_OK) return code;
-  // So that the span is not found again; it goes with the records after it.
+  // Raise the span's first time to the limit, or the same span would be found again. The true first
+  // time may be later, which costs a needless look at most. The row itself goes with the records
+  // after it.
   statements_.shortenSpan.bind(1, span);
   statements_.shortenSpan.bind(2, time);
   return statements_.shortenSpan.run();

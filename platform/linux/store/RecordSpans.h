@@ -8,35 +8,39 @@
 
 namespace halvox::platform::linux_ {
 
-// The numbers and the times of one kind's records: gives each record its number, keeps the first
-// and the last time of each run of records, and deletes the oldest records by number or by time.
-// Belongs to the writer's thread; everything happens in the open transaction.
+// Numbers the records of one kind and keeps the first and the last time of each span of
+// kRecordsPerSpan records. Deletes records from the oldest, by number or by time; the spans find
+// them without an index on the time.
+// Owned by a RecordKind and used by the writer's thread only. Works in the open transaction, except
+// for prepare(). Functions that use the database return SQLITE_OK or an error.
+//
+// For each record: note() its times, then advance(). Before the commit: flush().
 class RecordSpans {
  public:
-  // The tables as the schema makes them; the texts are constants.
+  // The names of the kind's tables. They are not copied: pass constants.
   RecordSpans(std::string_view records, std::string_view spans)
       : recordsTable_(records), spansTable_(spans) {}
 
-  // Prepares the statements, after each opening of the database.
+  // Prepares the statements and reads the next number, after each opening of the database.
   [[nodiscard]] SqliteCode prepare(Database& database);
-  // Lets go of all statements, before each closing.
+  // Finalizes all statements, before each closing of the database.
   void release() { statements_ = {}; }
 
-  // The number of the next record. Numbers only grow, even when all records were deleted.
+  // The number of the next record. Numbers only grow, even after all records were deleted: readers
+  // that follow the store rely on it.
   [[nodiscard]] std::int64_t next() const { return next_; }
-  // The record of that number has that time (seconds since 1970).
+  // Adds a time (seconds since 1970) to the span of the next record.
   [[nodiscard]] SqliteCode note(double time);
-  // The record of that number is written.
+  // Moves on to the number after next(), once that record is written.
   void advance() { ++next_; }
-  // Writes what was noted; before the commit.
+  // Writes the times of the current span.
   [[nodiscard]] SqliteCode flush();
   void onCommitted() { nextCommitted_ = next_; }
-  // The transaction failed: its numbers are given again.
+  // Called after a failed transaction. Its numbers will be used again.
   void onRolledBack();
 
-  // The time of the oldest record, when there is one.
+  // See RecordKind.
   [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time);
-  // As RecordKind has it.
   [[nodiscard]] SqliteCode deleteOldest(bool& found);
   [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found);
 
@@ -50,7 +54,7 @@ class RecordSpans {
     Statement deleteAgedRecords;
     Statement shortenSpan;
   };
-  // The times of a run of records; see the schema.
+  // The times in the current span that flush() has not written yet.
   struct Span {
     std::int64_t number = -1;
     double firstTime = 0;

@@ -15,20 +15,20 @@ struct RecordColumn {
   ColumnType type;
 };
 
-// One kind of record that is written as it comes: the tables that hold it, as the schema makes
-// them, and what is in a record besides its number and its time.
+// Describes one kind of record that is stored one to a row. The writer, the readers and retention
+// make their SQL from it. Names and columns must agree with the migrations in StoreSchema.cpp.
 struct RecordTable {
-  std::string_view records;
-  std::string_view spans;
-  std::span<const RecordColumn> columns;
-  std::size_t nameColumn;     // what patterns of names are for; kNoColumn: nothing
-  std::int64_t sinceVersion;  // of the schema
-  std::string_view piece;     // under which its records are counted
+  std::string_view records;               // the table of the records
+  std::string_view spans;                 // the table of their first and last times
+  std::span<const RecordColumn> columns;  // after the two that all kinds have: id and time
+  std::size_t nameColumn;                 // the column that name patterns match, or kNoColumn
+  std::int64_t sinceVersion;              // the schema version that introduced the kind
+  std::string_view piece;                 // the name under which its records are counted
 };
 
 constexpr std::size_t kNoColumn = static_cast<std::size_t>(-1);
 
-// Columns of the tables, as indices in what a record holds.
+// Indices into RecordTable::columns.
 enum IssueMetricColumn : std::uint8_t { kMetricID, kMetricMessage };
 enum PowerEventColumn : std::uint8_t { kPowerCategory, kPowerEventName, kPowerPayload };
 enum LinkMessageColumn : std::uint8_t {

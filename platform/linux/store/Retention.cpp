@@ -10,11 +10,12 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::chrono::minutes kAgeInterval{1};
-// Steps in one transaction: few enough that waiting records are not held up, enough to keep up with
-// the fastest writing.
+// The most steps in one transaction, so that waiting records are not held up for long. A step by
+// age covers a span of 512 records of each kind. A step by size deletes 64 records: 128 steps
+// delete 8,192, twice what one transaction can add, so retention keeps up with any writing.
 constexpr int kAgeSteps = 16;
 constexpr int kSizeSteps = 128;
-constexpr std::uint64_t kLeastPage = 512;  // that SQLite knows
+constexpr std::uint64_t kLeastPage = 512;  // SQLite's smallest page
 
 SqliteCode readInteger(Statement& statement, std::uint64_t& value) {
   const SqliteCode code = statement.step();
@@ -23,8 +24,8 @@ SqliteCode readInteger(Statement& statement, std::uint64_t& value) {
   return code == SQLITE_ROW ? SQLITE_OK : code;
 }
 
-// Deletes of the kind whose oldest record is the oldest: a flood of one kind must not drive out
-// others that are younger than it.
+// Deletes from the kind that has the oldest record of all. A flood of one kind then displaces its
+// own records and older ones, never newer ones of another kind.
 SqliteCode deleteOldest(std::span<RecordKind* const> kinds, bool& found) {
   RecordKind* oldest = nullptr;
   double oldestTime = 0;
@@ -40,7 +41,7 @@ SqliteCode deleteOldest(std::span<RecordKind* const> kinds, bool& found) {
   return oldest == nullptr ? SQLITE_OK : oldest->deleteOldest(found);
 }
 
-// One step of each kind.
+// Runs one step for each kind. `found` is true when any of them found something.
 template <typename Step>
 SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
   found = false;
@@ -57,7 +58,8 @@ SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
 
 SqliteCode Retention::prepare(Database& database) {
   pageBytes_ = static_cast<std::uint64_t>(database.queryInteger("PRAGMA page_size").value_or(0));
-  // Each page that is moved is written to the log, so few at a time.
+  // Vacuum writes each page that it moves to the log. Move so few at a time that the log does not
+  // outgrow its limit.
   const std::uint64_t vacuumPages =
       limits_.transactionBytes / (2 * std::max(pageBytes_, kLeastPage));
   const std::string vacuum = "PRAGMA incremental_vacuum(" + std::to_string(vacuumPages) + ")";
@@ -95,14 +97,14 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
     static_cast<void>(statements_.rollback.run());
     return code;
   }
-  // The file itself shrinks when the log is copied into it.
+  // The file becomes shorter only when the log is copied into it.
   const bool hasShrunk = fileBytes() < before;
   return hasShrunk && !more ? statements_.checkpoint.run() : SQLITE_OK;
 }
 
 bool Retention::isFull() const {
-  // Pages hold a little more than payloads. With this much free, what is written next fills free
-  // pages and the file need not grow.
+  // Reserve the payload of one transaction and a quarter for what pages hold beside it. Then the
+  // next transaction fills free pages, and the file does not grow.
   const std::uint64_t reserve = limits_.transactionBytes + limits_.transactionBytes / 4;
   return (pages_ - freePages_) * pageBytes_ + reserve > limits_.databaseBytes;
 }

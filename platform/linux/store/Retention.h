@@ -9,32 +9,34 @@
 
 namespace halvox::platform::linux_ {
 
-// Keeps the store within its age and its size, by deleting the oldest records, of whatever kind, in
-// small steps.
-// Belongs to the writer's thread. Uses no timer: it is asked after commits, and at the start.
+// Keeps the store within its limits of age and size: deletes the oldest records of all kinds, in
+// small transactions between those that store records.
+// Owned by the store and used by the writer's thread only. Has no timer, because an idle service
+// makes no wake-ups: the writer calls it at the start and after commits. Records of a service that
+// receives nothing therefore outlive their age until the next record comes.
 class Retention {
  public:
   struct Limits {
     std::chrono::seconds age;
     std::uint64_t databaseBytes;
-    std::uint64_t transactionBytes;  // how much one transaction adds, about
+    std::uint64_t transactionBytes;  // how much payload one transaction may add
   };
   explicit Retention(const Limits& limits) : limits_(limits) {}
 
   // Prepares the statements, after each opening of the database.
   [[nodiscard]] SqliteCode prepare(Database& database);
-  // Lets go of all statements, before each closing.
+  // Finalizes all statements, before each closing of the database.
   void release();
 
-  // Deletes what is due in one small transaction of its own. `now` is seconds since 1970. Without
-  // an error, `more` tells whether some is left for another call.
+  // Runs one step in a transaction of its own. `now` is seconds since 1970. Sets `more` when
+  // another call has work to do. On an error the step is rolled back.
   [[nodiscard]] SqliteCode runOnce(double now, std::span<RecordKind* const> kinds, bool& more);
 
  private:
   using Time = std::chrono::steady_clock::time_point;
 
   [[nodiscard]] SqliteCode readUse();
-  // Whether there is no room for another transaction.
+  // Returns true when another transaction could make the file outgrow its limit.
   [[nodiscard]] bool isFull() const;
   [[nodiscard]] std::uint64_t fileBytes() const { return pages_ * pageBytes_; }
   [[nodiscard]] SqliteCode deleteAged(double now, std::span<RecordKind* const> kinds, bool& more);
@@ -54,7 +56,7 @@ class Retention {
   std::uint64_t pageBytes_ = 0;
   std::uint64_t pages_ = 0;
   std::uint64_t freePages_ = 0;
-  Time nextByAge_{};  // the first call looks at ages
+  Time nextByAge_{};  // in the past, so that the first call looks for expired records
 };
 
 }  // namespace halvox::platform::linux_

@@ -39,7 +39,7 @@ class RetentionTest : public StoreTest {
   }
 };
 
-TEST_F(RetentionTest, DeletesWhatIsTooOldAtTheStart) {
+TEST_F(RetentionTest, DeletesExpiredEventsAtTheStart) {
   start();
   sendAt(kNow - 31 * kDay, 1);
   sendAt(kNow - 29 * kDay, 2);
@@ -60,7 +60,7 @@ TEST_F(RetentionTest, DeletesManyOldEvents) {
   EXPECT_THAT(payloads(), ElementsAre(numbered(-1)));
 }
 
-TEST_F(RetentionTest, KeepsNewEventsThatCameBeforeOldOnes) {
+TEST_F(RetentionTest, KeepsNewEventsThatWereStoredBeforeOldOnes) {
   start();
   sendAt(kNow, 1);
   sendAt(kNow - 40 * kDay, 2);
@@ -71,7 +71,7 @@ TEST_F(RetentionTest, KeepsNewEventsThatCameBeforeOldOnes) {
   EXPECT_THAT(payloads(), ElementsAre(numbered(1), numbered(3)));
 }
 
-TEST_F(RetentionTest, NumbersGoOnGrowingAfterEverythingWasDeleted) {
+TEST_F(RetentionTest, NumbersGrowAfterEverythingWasDeleted) {
   start();
   for (std::int64_t number = 0; number < 5000; ++number) sendAt(kNow - 40 * kDay, number);
   stop();

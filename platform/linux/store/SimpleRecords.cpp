@@ -74,8 +74,8 @@ void SimpleRecordKind::endTransaction(FinishedRecords& finished) {
   if (tooLarge_ > 0) {
     counters_.addDropped(DropReason::kTooLarge, tooLarge_);
     if (tooLargeLines_.tryPass()) {
-      kLog.error("dropped a record of ", table_.piece, " that is longer than ", longestPayload_,
-                 " bytes");
+      kLog.error("dropped a record of ", table_.piece, ": its payload is longer than ",
+                 longestPayload_, " bytes");
     }
   }
   finished.written += written_;

@@ -16,8 +16,8 @@
 
 namespace halvox::platform::linux_ {
 
-// What all kinds of records that are written as they come have in common: all but the records
-// themselves. Any thread may add; the rest is called by the writer.
+// The part of SimpleRecords that does not depend on the type of the record. Threads, owner and
+// failures are those of RecordKind.
 class SimpleRecordKind : public RecordKind {
  public:
   [[nodiscard]] SqliteCode prepare(Database& database) final;
@@ -36,21 +36,21 @@ class SimpleRecordKind : public RecordKind {
   }
 
  protected:
-  // The first column's place among the values of the statement that inserts a record.
+  // The parameter of the record's first own column in the INSERT: 1 is the ID, 2 the time.
   static constexpr int kFirstColumn = 3;
 
-  // What the statement that inserts a record was given.
+  // What was bound to the INSERT.
   struct Bound {
     double time;
-    std::size_t bytes;  // of the payload
+    std::size_t bytes;  // the length of the payload
   };
 
-  // Does not own its arguments, which must outlive it; the table is a constant. `longestPayload`
-  // in bytes.
+  // Does not own its arguments, which must outlive it. `longestPayload` is in bytes.
   SimpleRecordKind(const RecordTable& table, WriterQueue& queue, StatisticsService& statistics,
                    std::uint64_t longestPayload);
 
-  // Runs `append`, which queues one record, once there is room; false when the store is closed.
+  // Waits for room and runs `append`, which queues one record. Returns false when the store is
+  // closed; then the record is counted as dropped.
   template <typename Append>
   bool addQueued(Append&& append) {
     counters_.addReceived();
@@ -59,11 +59,11 @@ class SimpleRecordKind : public RecordKind {
     return added;
   }
 
-  // Makes the queued records the taken ones, of which there are none; returns how many.
+  // Moves the queued records to the taken ones and returns their number.
   virtual std::size_t takeRecords() = 0;
-  // Gives the columns of that taken record to the statement. They live until the next call.
+  // Binds the columns of a taken record to the statement. They stay valid until the next call.
   virtual Bound bindRecord(std::size_t index, Statement& statement, PayloadEncoder& encoder) = 0;
-  // Lets go of all taken records.
+  // Frees all taken records.
   virtual void forgetRecords() = 0;
 
  private:
@@ -75,35 +75,35 @@ class SimpleRecordKind : public RecordKind {
   RecordCounters counters_;
   const std::uint64_t longestPayload_;
 
-  // The writer's.
+  // Used by the writer's thread only.
   PayloadEncoder encoder_;
   RecordSpans spans_;
   Statement insert_;
   std::size_t taken_ = 0;
-  std::size_t next_ = 0;            // taken records before this are written
-  std::uint64_t written_ = 0;       // records of the open transaction
-  std::uint64_t writtenBytes_ = 0;  // and their payloads
-  std::uint64_t tooLarge_ = 0;      // of them not stored
+  std::size_t next_ = 0;            // the first taken record that is not written yet
+  std::uint64_t written_ = 0;       // records in the open transaction, those too large included
+  std::uint64_t writtenBytes_ = 0;  // the length of their payloads
+  std::uint64_t tooLarge_ = 0;      // records among written_ that were dropped for their length
   OncePerSecond tooLargeLines_;
 };
 
-// The records of one kind. `Record` has `table` (its RecordTable), `time` in seconds since 1970,
-// and `bind(Statement&, int firstColumn, PayloadEncoder&)`, which gives the statement its columns
-// and returns the bytes of its payload.
+// One kind of record that is stored one to a row. `Record` has `table` (its RecordTable), `time`
+// (seconds since 1970) and `bind`, as StoreRecords.h describes.
 template <typename Record>
 class SimpleRecords final : public SimpleRecordKind {
  public:
   SimpleRecords(WriterQueue& queue, StatisticsService& statistics, std::uint64_t longestPayload)
       : SimpleRecordKind(Record::table, queue, statistics, longestPayload) {}
 
-  // Queues a record. Waits while the queue is full; never for the disk. False when the store is
-  // closed: then it is dropped and counted.
+  // Any thread. Queues a record. Waits while the queue is full, but never for the disk itself.
+  // Returns false when the store is closed; then the record is dropped and counted.
   bool add(Record record) {
     return addQueued([&] { queued_.push_back(std::move(record)); });
   }
 
  private:
-  // A burst's memory is given back; what an ordinary round needs is kept.
+  // Memory for this many records is kept between rounds: as many as the queue's soft limit. A burst
+  // that needed more gives its memory back.
   static constexpr std::size_t kKeptRecords = 8192;
 
   std::size_t takeRecords() override {
@@ -112,7 +112,7 @@ class SimpleRecords final : public SimpleRecordKind {
     return taken_.size();
   }
   Bound bindRecord(std::size_t index, Statement& statement, PayloadEncoder& encoder) override {
-    // What was written before is not needed any more.
+    // Frees the record before this one, so that memory shrinks while a large batch is written.
     bound_ = std::move(taken_[index]);
     return {bound_.time, bound_.bind(statement, kFirstColumn, encoder)};
   }
@@ -122,9 +122,10 @@ class SimpleRecords final : public SimpleRecordKind {
     if (taken_.capacity() > kKeptRecords) taken_ = std::vector<Record>();
   }
 
-  std::vector<Record> queued_;  // under the queue's lock
-  std::vector<Record> taken_;   // the writer's
-  Record bound_;                // the writer's: what the statement refers to
+  std::vector<Record> queued_;  // guarded by the lock of the WriterQueue
+  // Used by the writer's thread only.
+  std::vector<Record> taken_;
+  Record bound_;  // owns the texts and bytes that are bound to the statement
 };
 
 }  // namespace halvox::platform::linux_

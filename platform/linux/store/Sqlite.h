@@ -13,34 +13,39 @@
 
 namespace halvox::platform::linux_ {
 
-// A result code of SQLite, extended ones included; SQLITE_OK is 0.
+// A result code of SQLite: SQLITE_OK (0), or a primary or extended error code.
 using SqliteCode = int;
 
-// A prepared statement. Belongs to the thread of its database and must go before it does.
+// One prepared statement, finalized when the object is destroyed. Used only on the thread of its
+// Database, and destroyed before the Database is closed. Errors are returned as codes;
+// Database::errorText() says more about the last one.
 class Statement {
  public:
   Statement() = default;
 
-  // Texts and bytes are not copied: what was bound must live until the statement has run.
+  // Parameter indices begin at 1. Texts and bytes are not copied: the caller keeps them alive until
+  // the statement has run.
   void bind(int index, std::int64_t number) { sqlite3_bind_int64(handle_.get(), index, number); }
   void bind(int index, double number) { sqlite3_bind_double(handle_.get(), index, number); }
   void bind(int index, std::string_view text) {
     sqlite3_bind_text64(handle_.get(), index, text.data(), text.size(), SQLITE_STATIC, SQLITE_UTF8);
   }
   void bind(int index, std::span<const std::byte> bytes) {
-    // Without an address the library would take no bytes for no value.
+    // SQLite stores NULL for a null pointer, even when the length is 0. An empty span may have one.
     const void* data = bytes.empty() ? "" : static_cast<const void*>(bytes.data());
     sqlite3_bind_blob64(handle_.get(), index, data, bytes.size(), SQLITE_STATIC);
   }
   void bindNull(int index) { sqlite3_bind_null(handle_.get(), index); }
 
-  // SQLITE_ROW, SQLITE_DONE or an error.
+  // Returns SQLITE_ROW, SQLITE_DONE or an error code.
   [[nodiscard]] SqliteCode step() { return sqlite3_step(handle_.get()); }
+  // Makes the statement ready to run again and ends its read of the database.
   void reset() { sqlite3_reset(handle_.get()); }
-  // Runs a statement whose rows, if any, do not matter: SQLITE_OK or an error.
+  // Runs the statement to its end, discards its rows and resets it. Returns SQLITE_OK or an error.
   [[nodiscard]] SqliteCode run();
 
-  // Columns of the current row; texts are valid until the next step or reset.
+  // The columns of the current row, counted from 0. Texts and bytes are valid until the next step
+  // or reset.
   [[nodiscard]] bool isNull(int column) const {
     return sqlite3_column_type(handle_.get(), column) == SQLITE_NULL;
   }
@@ -61,23 +66,27 @@ class Statement {
 
 enum class DatabaseAccess : std::uint8_t { kReadWrite, kReadOnly };
 
-// One connection to a database file. Belongs to one thread at a time.
+// One connection to a database file, closed when the object is destroyed. One thread at a time may
+// use it: SQLite's own locking of connections is turned off. Calls block on the disk, and on locks
+// of other connections for as long as sqlite3_busy_timeout() allows.
 class Database {
  public:
-  // Opens an existing file, named by path or by a "file:" URI. Reads nothing of it yet.
+  // Opens an existing file, named by a path or a "file:" URI, and never creates one. SQLite does
+  // not read the file before the first statement, so a damaged file is noticed only then.
   [[nodiscard]] SqliteCode open(const std::string& file, DatabaseAccess access);
-  // Closes the connection; its statements must be gone.
+  // Closes the connection. All its statements must have been destroyed before.
   void close() { handle_.reset(); }
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(handle_); }
 
   [[nodiscard]] SqliteCode prepare(std::string_view sql, Statement& statement);
-  // Runs one or several statements; rows do not matter.
+  // Runs one or more statements and discards their rows.
   [[nodiscard]] SqliteCode execute(const std::string& sql);
-  // The first column of the first row; none on an error or when there is no row.
+  // Returns the first column of the first row; std::nullopt on an error or without a row.
   [[nodiscard]] std::optional<std::int64_t> queryInteger(std::string_view sql);
 
-  // The last error in words, with the system's own when there was one.
+  // Describes the last error: SQLite's text and, if there was one, the system's in parentheses.
   [[nodiscard]] std::string errorText() const;
+  // The errno of the system call behind the last error; 0 when there was none.
   [[nodiscard]] int systemError() const { return sqlite3_system_errno(handle_.get()); }
   [[nodiscard]] sqlite3* get() const { return handle_.get(); }
 

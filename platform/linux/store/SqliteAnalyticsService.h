@@ -6,15 +6,16 @@
 
 namespace halvox::platform::linux_ {
 
-// Records events in the store. Wanted are the names that match the store's patterns.
-// Any thread may call. Does not own the store and the clock, which must outlive it.
+// Records analytics events in the store: those whose names match StoreOptions::wantedEvents.
+// Any thread may call. Does not own the store and the clock, which must outlive it. Failures of the
+// store are counted and logged there and never reach the caller.
 class SqliteAnalyticsService final : public AnalyticsService {
  public:
   SqliteAnalyticsService(SqliteStore& store, const ClockService& clock)
       : names_(store.eventNames()), records_(store.analyticsRecords()), clock_(clock) {}
 
   [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override;
-  // The event's time is that of the call.
+  // Stamps the event with the time of the call. The builder runs later, on the writer's thread.
   void sendAnalyticsEventLazy(std::string eventName, AnalyticsPayloadBuilder builder) override;
 
  private:

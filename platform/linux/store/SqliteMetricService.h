@@ -6,8 +6,9 @@
 
 namespace halvox::platform::linux_ {
 
-// Records metrics in the store, under the time of the call. Any thread may call. Does not own the
-// store and the clock, which must outlive it.
+// Records metrics in the store with the time of the call. Any thread may call. Does not own the
+// store and the clock, which must outlive it. Failures of the store are counted and logged there
+// and never reach the caller.
 class SqliteMetricService final : public MetricService {
  public:
   SqliteMetricService(SqliteStore& store, const ClockService& clock)

@@ -6,14 +6,16 @@
 
 namespace halvox::platform::linux_ {
 
-// Records power events in the store, under the time of the call. Any thread may call. Does not own
-// the store and the clock, which must outlive it.
+// Records power events in the store with the time of the call. Any thread may call. Does not own
+// the store and the clock, which must outlive it. Failures of the store are counted and logged
+// there and never reach the caller.
 class SqlitePowerLogService final : public PowerLogService {
  public:
   SqlitePowerLogService(SqliteStore& store, const ClockService& clock)
       : records_(store.powerEvents()), clock_(clock) {}
 
-  // The entries of `extra` join the payload; where both have a key, the payload's own stays.
+  // Stores `payload` and `extra` as one dictionary. If both have a key, the value of `extra` is
+  // lost.
   void logPowerEvent(std::uint32_t categoryID, std::string_view eventName,
                      const Dictionary& payload, const std::optional<Dictionary>& extra) override;
 

@@ -15,9 +15,10 @@ namespace {
 
 constexpr UnitLog kLog{storeCategory, "SqliteStore"};
 
-// Bounds how long one transaction, and with it the visibility of a record, can take.
+// Bounds the time of a transaction, and with it the time until a record is visible to readers.
 constexpr std::int64_t kRecordsPerTransaction = 4096;
-// After a failure records gather for so long before the next attempt.
+// How long records gather after a failure before the next attempt. A failing disk is then tried
+// four times a second, not once for each batch of a flood.
 constexpr std::chrono::milliseconds kRetryTime{250};
 
 DropReason reasonOf(SqliteCode code, int systemError) {
@@ -29,7 +30,8 @@ DropReason reasonOf(SqliteCode code, int systemError) {
   return DropReason::kInputOutput;
 }
 
-// The library's count of its memory costs an atomic lock at each allocation, and nobody reads it.
+// SQLite counts the memory that it uses, which takes a lock at each allocation. Nothing here reads
+// that count. SQLite accepts this setting only before its first use in the process.
 void configureLibrary() {
   static const bool kDone = [] {
     sqlite3_config(SQLITE_CONFIG_MEMSTATUS, 0);
@@ -85,8 +87,10 @@ void SqliteStore::writeTaken() {
   while (hasTaken()) {
     if (!makeReady()) return;
     const SqliteCode code = writeTransaction();
-    if (code != SQLITE_OK) return fail(code, "events were not stored");
+    if (code != SQLITE_OK) return fail(code, "cannot store records");
     onStored();
+    // After every transaction, not only when idle: under a steady flood the writer never is, and
+    // the file must not outgrow its limit.
     static_cast<void>(maintainOnce());
   }
 }
@@ -95,11 +99,13 @@ bool SqliteStore::hasTaken() const {
   return std::ranges::any_of(kinds_, [](const RecordKind* kind) { return kind->hasTaken(); });
 }
 
-// Opens the database when it is not open, and when its path leads to another file or to none.
+// Opens the database if it is not open, or if its path now leads to another file or to none:
+// records in a file without a name would be lost. Returns false after dropping the taken records.
 bool SqliteStore::makeReady() {
   if (database_.isOpen() && files_.identity() == identity_) return logHasRoom();
   if (database_.isOpen()) {
-    kLog.error(files_.database().c_str(), ": the file was removed or replaced, opening it anew");
+    kLog.error(files_.database().c_str(),
+               ": the database file was removed or replaced; opening the one that is there now");
     abandonDatabase();
   }
   const auto error = openDatabase();
@@ -108,8 +114,9 @@ bool SqliteStore::makeReady() {
   return false;
 }
 
-// The log cannot begin anew while somebody reads a state of the database that is older than it. A
-// reader that never ends must not fill the disk.
+// SQLite can start its write-ahead log anew only when no reader uses an older state of the
+// database. A reader that never finishes makes the log grow without end. When the log is as large
+// as the database may be, records are dropped instead of filling the disk.
 bool SqliteStore::logHasRoom() {
   if (files_.logBytes() <= sizes_.databaseBytes) return true;
   const SqliteCode code = sqlite3_wal_checkpoint_v2(database_.get(), nullptr,
@@ -117,9 +124,11 @@ bool SqliteStore::logHasRoom() {
   if (code == SQLITE_OK) return true;
   if ((code & 0xFF) == SQLITE_BUSY) {
     drop(DropReason::kLogHeld,
-         files_.database().native() + ": the log is as large as it may be, and somebody reads it");
+         files_.database().native() +
+             ": the write-ahead log has reached its size limit because another program keeps "
+             "reading an old state of the database");
   } else {
-    fail(code, "the log cannot be copied into the database");
+    fail(code, "cannot copy the write-ahead log into the database");
   }
   return false;
 }
@@ -130,7 +139,7 @@ std::optional<StoreError> SqliteStore::openDatabase() {
   if (prepareStatements() == SQLITE_OK) return std::nullopt;
   StoreError error{
       StoreError::Kind::kCannotOpen,
-      files_.database().native() + ": the database cannot be read: " + database_.errorText()};
+      files_.database().native() + ": cannot read the database: " + database_.errorText()};
   abandonDatabase();
   return error;
 }
@@ -162,12 +171,12 @@ void SqliteStore::onStored() {
   for (RecordKind* const kind : kinds_) kind->onCommitted(finished);
   queue_.finish(finished.written, finished.writtenBytes);
   const std::uint64_t dropped = std::exchange(droppedSinceStored_, 0);
-  if (dropped > 0) kLog.notice("storing again; ", dropped, " events were dropped");
+  if (dropped > 0) kLog.notice("storing again after a failure; ", dropped, " records were dropped");
 }
 
 void SqliteStore::fail(SqliteCode code, std::string_view what) {
-  // Before anything else, because every call replaces the last error. For a failed commit the
-  // library does not say what the system said; then it is the last that the system said at all.
+  // Read the errors first: every other call replaces them. After a failed commit SQLite does not
+  // return the system's error. Then take errno, which writeTransaction() cleared.
   const int lastError = errno;
   const int systemError = database_.systemError() != 0 ? database_.systemError() : lastError;
   const DropReason reason = reasonOf(code, systemError);
@@ -177,7 +186,7 @@ void SqliteStore::fail(SqliteCode code, std::string_view what) {
     static_cast<void>(database_.execute("ROLLBACK"));
   }
   drop(reason, description);
-  // After these two the connection is as good as new.
+  // After a lock or a full disk the connection remains usable. After any other error open it again.
   if (reason == DropReason::kLocked || reason == DropReason::kDiskFull) return;
   abandonDatabase();
   if (reason != DropReason::kDamaged) return;
@@ -185,12 +194,14 @@ void SqliteStore::fail(SqliteCode code, std::string_view what) {
   if (const auto error = files_.setAside(newName)) {
     kLog.error("", error->description);
   } else {
-    kLog.error("the damaged database was set aside as ", newName);
+    kLog.error("the damaged database was set aside as ", newName,
+               "; the next record begins an empty one");
   }
 }
 
 void SqliteStore::drop(DropReason reason, std::string_view what) {
-  // Waiting for a locked file must not look like slow writing, or callers would have to wait too.
+  // The time spent on a locked file must not count as slow writing: the queue would lower its
+  // limits and make callers wait.
   queue_.disregardTime();
   FinishedRecords finished;
   for (RecordKind* const kind : kinds_) droppedSinceStored_ += kind->dropTaken(reason, finished);
@@ -198,7 +209,8 @@ void SqliteStore::drop(DropReason reason, std::string_view what) {
   queue_.finish(finished.unwritten, 0);
   nextRound_ = std::chrono::steady_clock::now() + kRetryTime;
   if (!failureLines_.tryPass()) return;
-  kLog.error("", what, "; ", droppedSinceStored_, " events dropped since the last were stored");
+  kLog.error("", what, "; ", droppedSinceStored_,
+             " records dropped since records were last stored; trying again with the next");
 }
 
 void SqliteStore::maintainWhileIdle() {
@@ -206,21 +218,21 @@ void SqliteStore::maintainWhileIdle() {
   }
 }
 
-// Deletes a little of what is due; true when there is more.
+// Runs one step of retention. Returns true when more remains to be deleted.
 bool SqliteStore::maintainOnce() {
   if (!database_.isOpen()) return false;
   bool more = false;
   const double now = clock_.currentDate().secondsSince1970;
   const SqliteCode code = retention_.runOnce(now, kinds_, more);
   if (code == SQLITE_OK) return more;
-  fail(code, "old events were not deleted");
+  fail(code, "cannot delete old records");
   return false;
 }
 
 void SqliteStore::closeDatabase() {
   releaseStatements();
   if (!database_.isOpen()) return;
-  // Closing does this too, but only when nobody reads.
+  // sqlite3_close() also copies the log, but only when no other connection is open.
   sqlite3_wal_checkpoint_v2(database_.get(), nullptr, SQLITE_CHECKPOINT_PASSIVE, nullptr, nullptr);
   database_.close();
 }

@@ -28,25 +28,28 @@ struct StoreOptions {
   std::filesystem::path directory;
   std::uint32_t retentionDays = 30;
   std::uint32_t maxMegabytes = 512;            // database and write-ahead log together
-  std::vector<std::string> wantedEvents{"*"};  // glob patterns of event names
+  std::vector<std::string> wantedEvents{"*"};  // patterns of event names, for fnmatch(3)
   QueueLimits queue{};
 };
 
-// The SQLite database halvox.db and the one thread that writes it.
+// The SQLite database halvox.db and the one thread that writes to it.
 //
 //   made --open()--> running --close()--> closed
 //
-// Callers queue records of each kind; the writer commits all that has come since its last commit,
-// at once when it was idle. A record whose caller was let go on is in the database within half a
-// second, whatever kills the process then.
+// Any thread adds records to the kinds below. The writer commits everything that has come since
+// its last commit, and starts at once when it was idle. A record is in the database within half a
+// second after the call that added it, unless the store dropped it; killing the process later
+// cannot lose it. A power cut can lose what the last checkpoint of the log had not synced.
 //
-// While running it absorbs failures: when the disk is full, the file locked or its reading or
-// writing fails, the records at hand are dropped and counted, one error line a second tells of it,
-// and the next records are tried again. A file that turns out damaged is set aside; one that was
-// deleted is replaced by a new one.
+// Failures never reach the callers. When the disk is full, the file is locked, or reading or
+// writing fails, the store drops and counts the records at hand, logs at most one error a second,
+// and tries again with the next records. It renames a damaged file and creates a file that was
+// deleted.
+//
+// Owned by the platform. open() and close() belong to one thread.
 class SqliteStore {
  public:
-  // The services are not owned and must outlive the store.
+  // The services belong to the platform and must outlive the store.
   struct Environment {
     ClockService& clock;
     StatisticsService& statistics;
@@ -58,10 +61,11 @@ class SqliteStore {
   SqliteStore& operator=(const SqliteStore&) = delete;
   ~SqliteStore() { close(); }
 
-  // Opens the database, or says why it cannot, and starts the writer. Once; blocks on the disk.
+  // Opens the database and starts the writer, or returns why it could not. Call it once. Blocks on
+  // the disk.
   [[nodiscard]] std::optional<StoreError> open();
-  // Writes what waits, copies the write-ahead log into the database and ends the writer. Records
-  // that come later are dropped. Any number of times; blocks until the writer is done.
+  // Writes the waiting records, copies the write-ahead log into the database and ends the writer.
+  // Later records are dropped and counted. Blocks until the writer has ended. Idempotent.
   void close();
 
   [[nodiscard]] EventNames& eventNames() { return eventNames_; }
@@ -71,7 +75,7 @@ class SqliteStore {
   [[nodiscard]] LinkMessageRecords& linkMessages() { return linkMessages_; }
   [[nodiscard]] SnapshotRecords& snapshots() { return snapshots_; }
   [[nodiscard]] const ClockService& clock() const { return clock_; }
-  // Records that wait to be stored. Any thread.
+  // The number of records that wait to be stored. Any thread may call.
   [[nodiscard]] std::uint64_t waiting() { return queue_.waiting(); }
 
  private:
@@ -107,9 +111,9 @@ class SqliteStore {
   const std::array<RecordKind*, 5> kinds_{&analyticsRecords_, &issueMetrics_, &powerEvents_,
                                           &linkMessages_, &snapshots_};
 
-  // The writer's, after open().
+  // After open() only the writer's thread uses these.
   Database database_;
-  std::optional<FileIdentity> identity_;  // of the file that is open
+  std::optional<FileIdentity> identity_;  // of the open file
   Statement begin_;
   Statement commit_;
   Retention retention_;

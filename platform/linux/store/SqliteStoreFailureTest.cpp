@@ -3,7 +3,7 @@
 #include "platform/linux/store/StoreTestSupport.h"
 #include "platform/linux/testing/FileSizeLimit.h"
 
-// How the store bears what happens to its file while it runs.
+// What the store does when something happens to its file while it runs.
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -18,7 +18,7 @@ using ::testing::SizeIs;
 
 class SqliteStoreFailureTest : public StoreTest {
  protected:
-  // Sends events until one is stored; false after ten seconds.
+  // Sends events until one is stored. Returns false after ten seconds.
   bool storesAgain() {
     const std::uint64_t before = counted("stored");
     return eventually([&] {
@@ -26,7 +26,7 @@ class SqliteStoreFailureTest : public StoreTest {
       return counted("stored") > before;
     });
   }
-  // One record of every kind but events.
+  // Adds one record of every kind except events.
   void addOneOfEachKind() {
     const double now = platform.clock.currentDate().secondsSince1970;
     const Dictionary payload{{"f", std::string(1000, 'x')}};
@@ -61,8 +61,8 @@ TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileTheDiskIsFullThenStoresA
   EXPECT_THAT(rows(database(), "PRAGMA integrity_check"), ElementsAre("ok"));
 }
 
-// Every kind of record meets the full disk together with the others, and none loses what it cannot
-// account for.
+// Records of all kinds share transactions, so one full disk fails them together. Each kind must
+// count its own losses.
 TEST_F(SqliteStoreFailureTest, RecordsOfEveryKindAreCountedWhileTheDiskIsFullAndStoredAgainLater) {
   start();
   const auto count = [this](std::string_view piece, std::string_view name) {
@@ -106,7 +106,7 @@ TEST_F(SqliteStoreFailureTest, LogsAtMostOneErrorLineASecond) {
       std::chrono::duration_cast<std::chrono::seconds>(std::chrono::steady_clock::now() - begun);
   EXPECT_LE(platform.log.lines(LogLevel::kError).size(),
             static_cast<std::size_t>(seconds.count()) + 1);
-  EXPECT_THAT(platform.log.texts(LogLevel::kError), Contains(HasSubstr("events dropped")));
+  EXPECT_THAT(platform.log.texts(LogLevel::kError), Contains(HasSubstr("records dropped")));
 }
 
 TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileAnotherProcessLocksTheFile) {
@@ -126,7 +126,7 @@ TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileAnotherProcessLocksTheFi
   expectBalance();
 }
 
-TEST_F(SqliteStoreFailureTest, GoesOnWhileAReaderHoldsAnOldSnapshot) {
+TEST_F(SqliteStoreFailureTest, StoresWhileAReaderHoldsAnOldSnapshot) {
   start();
   send(1);
   ASSERT_TRUE(allIsStored());
@@ -184,7 +184,7 @@ TEST_F(SqliteStoreFailureTest, BeginsANewDatabaseWhenItsWholeDirectoryIsDeleted)
   EXPECT_THAT(payloads(), ElementsAre(numbered(2)));
 }
 
-TEST_F(SqliteStoreFailureTest, GoesOnWithTheDatabaseThatWasPutInThePlaceOfItsOwn) {
+TEST_F(SqliteStoreFailureTest, ContinuesWithADatabaseThatReplacedItsOwn) {
   start();
   send(1);
   stop();
@@ -201,7 +201,7 @@ TEST_F(SqliteStoreFailureTest, GoesOnWithTheDatabaseThatWasPutInThePlaceOfItsOwn
   EXPECT_THAT(payloads(), ElementsAre(numbered(1), numbered(3)));
 }
 
-TEST_F(SqliteStoreFailureTest, SetsAFileThatIsDestroyedWhileItRunsAsideAndGoesOn) {
+TEST_F(SqliteStoreFailureTest, SetsAsideAFileThatIsDestroyedWhileItRunsAndContinues) {
   options.maxMegabytes = 4;
   start();
   const std::string filler(500, 'x');
@@ -210,7 +210,7 @@ TEST_F(SqliteStoreFailureTest, SetsAFileThatIsDestroyedWhileItRunsAsideAndGoesOn
   };
   for (int number = 0; number < 10'000; ++number) sendLong();
   ASSERT_TRUE(allIsStored());
-  // Written over in place, log included: what a failing disk or a stray program does.
+  // Overwrite the database and its log in place, as a failing disk or a stray program would.
   for (const char* suffix : {"", "-wal"}) {
     const std::string path = database().native() + suffix;
     std::FILE* file = std::fopen(path.c_str(), "r+");

@@ -9,7 +9,7 @@
 
 #include "platform/linux/store/StoreTestSupport.h"
 
-// What is left of a store whose process was killed under load.
+// What remains of a store whose process was killed under load.
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -19,10 +19,10 @@ using ::testing::ElementsAre;
 using Clock = std::chrono::steady_clock;
 constexpr std::size_t kMostEvents = 4'000'000;
 
-// Written by the process that is going to be killed, read by the one that kills it.
+// Shared memory: the process that will be killed writes it, the test reads it.
 struct Progress {
   std::atomic<std::size_t> sent;
-  Clock::time_point times[kMostEvents];  // when the sending of an event was over
+  Clock::time_point times[kMostEvents];  // when each send() returned
 };
 
 class SqliteStoreKillTest : public StoreTest {
@@ -44,8 +44,8 @@ class SqliteStoreKillTest : public StoreTest {
     ::_exit(2);
   }
 
-  // Kills a sending process so long after its start; gives how many of its events are older than
-  // half a second at that moment.
+  // Kills a sending process `time` after its first event. Returns how many of its events were
+  // older than half a second at that moment.
   std::size_t killAfter(std::chrono::milliseconds time) {
     progress_->sent = 0;
     const pid_t child = ::fork();
@@ -76,7 +76,7 @@ class SqliteStoreKillTest : public StoreTest {
   Progress* progress_;
 };
 
-TEST_F(SqliteStoreKillTest, LacksAtMostWhatWasSentInTheLastHalfSecond) {
+TEST_F(SqliteStoreKillTest, LosesAtMostTheEventsOfTheLastHalfSecond) {
   for (const int time : {30, 700, 1100}) {
     std::filesystem::remove_all(options.directory);
     const std::size_t old = killAfter(std::chrono::milliseconds(time));
@@ -87,7 +87,7 @@ TEST_F(SqliteStoreKillTest, LacksAtMostWhatWasSentInTheLastHalfSecond) {
   }
 }
 
-TEST_F(SqliteStoreKillTest, AKilledStoreOpensAgainAndGoesOn) {
+TEST_F(SqliteStoreKillTest, AKilledStoreOpensAgainAndContinues) {
   killAfter(std::chrono::milliseconds(200));
   const std::size_t before = payloads().size();
   start();

@@ -200,7 +200,7 @@ TEST_F(SqliteStoreTest, TheDatabaseIsReadableByOwnerAndGroupOnly) {
   EXPECT_EQ(status.st_mode & 0777U, 0640U);
 }
 
-// How often the writer's thread went to sleep so far.
+// Returns how often the writer's thread has gone to sleep so far.
 std::string writerSleeps() {
   for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
     if (readFile(task.path() / "comm") != "halvox-store\n") continue;
@@ -217,7 +217,7 @@ TEST_F(SqliteStoreTest, DoesNotWakeUpWhileNothingIsSent) {
   ASSERT_TRUE(allIsStored());
   std::string sleeps;
   ASSERT_TRUE(eventually([&] { return std::exchange(sleeps, writerSleeps()) == sleeps; }));
-  std::this_thread::sleep_for(std::chrono::milliseconds(500));  // the idle time that is observed
+  std::this_thread::sleep_for(std::chrono::milliseconds(500));  // the idle time to observe
   EXPECT_EQ(writerSleeps(), sleeps);
 }
 

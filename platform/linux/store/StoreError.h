@@ -5,15 +5,16 @@
 
 namespace halvox::platform::linux_ {
 
-// Why the store could not be opened; `description` names the file and the reason, for the user.
+// Why a store could not be opened or read. `description` is a line for the user that names the
+// file and the reason.
 struct StoreError {
   enum class Kind : std::uint8_t {
-    kDirectory,     // the directory cannot be made or written to
-    kInUse,         // another service writes this store
-    kNewerVersion,  // a newer version of the system made it; it was left alone
-    kMissing,       // there is none (when reading)
-    kDamaged,       // it is no database, or a broken one (when reading)
-    kCannotOpen,    // anything else the system or the database library had to say
+    kDirectory,     // the directory or a file in it cannot be created or written to
+    kInUse,         // another service writes to this store
+    kNewerVersion,  // a newer version of the program made the store, which was not touched
+    kMissing,       // there is no store (readers only)
+    kDamaged,       // the file is not a database, or a broken one (readers only)
+    kCannotOpen,    // any other error of the system or of SQLite
   };
   Kind kind;
   std::string description;

@@ -17,6 +17,8 @@ namespace {
 constexpr std::string_view kLockFileName = "halvox.lock";
 constexpr std::array<std::string_view, 3> kSuffixes{"", "-wal", "-shm"};
 constexpr mode_t kFileMode = 0640;
+// Names have a resolution of one second. Ends the search in a directory full of such files; the
+// rename then replaces the last one tried.
 constexpr int kMostNamesTried = 100;
 
 StoreError failure(StoreError::Kind kind, const std::filesystem::path& path, std::string_view what,
@@ -63,26 +65,29 @@ StoreFiles::StoreFiles(const std::filesystem::path& directory)
 
 std::optional<StoreError> StoreFiles::claimDirectory() {
   struct stat status {};
+  // A lock on a file without a name keeps nobody out: another service would create a new file.
   if (lock_ && ::fstat(lock_.get(), &status) == 0 && status.st_nlink > 0) return std::nullopt;
   std::error_code error;
   std::filesystem::create_directories(directory_, error);
   if (error) {
-    return failure(StoreError::Kind::kDirectory, directory_, "the directory cannot be made",
+    return failure(StoreError::Kind::kDirectory, directory_, "cannot create the storage directory",
                    error.value());
   }
   const std::filesystem::path path = directory_ / kLockFileName;
   lock_.reset(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, kFileMode));
   if (!lock_) {
-    return failure(StoreError::Kind::kDirectory, path, "the file cannot be written", errno);
+    return failure(StoreError::Kind::kDirectory, path, "cannot open the lock file", errno);
   }
   if (::flock(lock_.get(), LOCK_EX | LOCK_NB) == 0) return std::nullopt;
   const int reason = errno;
   lock_.reset();
   if (reason != EWOULDBLOCK) {
-    return failure(StoreError::Kind::kCannotOpen, path, "the file cannot be locked", reason);
+    return failure(StoreError::Kind::kCannotOpen, path, "cannot lock the file", reason);
   }
   return StoreError{StoreError::Kind::kInUse,
-                    database_.native() + ": another service is using this store"};
+                    database_.native() +
+                        ": another service is using this store; stop it or set "
+                        "another storage.directory"};
 }
 
 std::optional<StoreError> StoreFiles::makeDatabaseFile() {
@@ -92,7 +97,7 @@ std::optional<StoreError> StoreFiles::makeDatabaseFile() {
   }
   const UniqueFd made(::open(database_.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, kFileMode));
   if (made || errno == EEXIST) return std::nullopt;
-  return failure(StoreError::Kind::kDirectory, database_, "the file cannot be made", errno);
+  return failure(StoreError::Kind::kDirectory, database_, "cannot create the database file", errno);
 }
 
 std::optional<StoreError> StoreFiles::setAside(std::string& newName) {
@@ -106,7 +111,7 @@ std::optional<StoreError> StoreFiles::setAside(std::string& newName) {
     if (::rename(from.c_str(), withSuffix(newName, suffix).c_str()) == 0 || errno == ENOENT) {
       continue;
     }
-    return failure(StoreError::Kind::kDirectory, from, "the file cannot be renamed", errno);
+    return failure(StoreError::Kind::kDirectory, from, "cannot rename the damaged file", errno);
   }
   return std::nullopt;
 }

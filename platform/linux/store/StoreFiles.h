@@ -12,7 +12,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Which file a path led to, to notice later that it leads to another one or to none.
+// Identifies the file that a path led to, to notice later that the path leads to another file.
 struct FileIdentity {
   dev_t device = 0;
   ino_t inode = 0;
@@ -20,24 +20,27 @@ struct FileIdentity {
 };
 
 // The files of one store in its directory: the lock, the database and its write-ahead log.
-// Belongs to the writer's thread, after the opening on the thread that starts it.
+// Owned by the store or a reader, and used by one thread at a time: in the service by the thread
+// that opens the store, then by the writer. Calls block on the disk.
 class StoreFiles {
  public:
   explicit StoreFiles(const std::filesystem::path& directory);
 
-  // Makes the directory with its parents, and takes the lock that keeps a second service away. The
-  // lock is held until this object goes; taking it again is cheap and notices a removed lock file.
+  // Creates the directory and its parents, and takes the lock that keeps a second service out.
+  // Holds the lock until this object is destroyed. A second call is cheap and takes the lock again
+  // if the lock file was removed. Fails with kDirectory, kInUse or kCannotOpen.
   [[nodiscard]] std::optional<StoreError> claimDirectory();
-  // Makes an empty database file, readable by owner and group, if there is none. A write-ahead log
-  // without its database is set aside first, because a new database must not meet an old log.
+  // Creates an empty database file, readable by owner and group, unless one exists. First renames
+  // a write-ahead log that has no database: SQLite deletes such a log when it opens an empty file.
   [[nodiscard]] std::optional<StoreError> makeDatabaseFile();
-  // Renames the database and what belongs to it to halvox.db.damaged-<UTC time>, and gives the new
-  // name. Nobody may have the database open.
+  // Renames the database, its log and its index to halvox.db.damaged-<UTC time> and returns the
+  // new path in `newName`. Nothing is deleted. The database must not be open in this process.
   [[nodiscard]] std::optional<StoreError> setAside(std::string& newName);
 
   [[nodiscard]] const std::filesystem::path& database() const { return database_; }
-  // The file that the database's path leads to now.
+  // The file that the database's path leads to now; std::nullopt when there is none.
   [[nodiscard]] std::optional<FileIdentity> identity() const;
+  // The size of the write-ahead log; 0 when there is none.
   [[nodiscard]] std::uint64_t logBytes() const;
 
  private:
@@ -46,7 +49,7 @@ class StoreFiles {
   UniqueFd lock_;
 };
 
-// The file that a path leads to now; none when there is none.
+// The file that a path leads to now; std::nullopt when there is none.
 [[nodiscard]] std::optional<FileIdentity> fileIdentity(const std::filesystem::path& path);
 
 }  // namespace halvox::platform::linux_

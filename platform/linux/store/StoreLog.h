@@ -13,9 +13,10 @@ inline LogCategory& storeCategory() {
   return category;
 }
 
-// Keeps a line that could come with every record from being logged more than once a second.
+// Limits a log line that could come with every record to one a second. Belongs to one thread.
 class OncePerSecond {
  public:
+  // Returns true when the line may be logged now, which begins the next second of silence.
   [[nodiscard]] bool tryPass() {
     const auto now = std::chrono::steady_clock::now();
     if (now < next_) return false;

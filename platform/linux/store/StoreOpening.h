@@ -9,27 +9,31 @@
 
 namespace halvox::platform::linux_ {
 
-// How large the parts of a store may become, derived from the one size that its user gave.
+// How large the parts of a store may become. All sizes derive from the one that the user set.
 struct StoreSizes {
-  std::uint64_t databaseBytes;     // past this the oldest records go
-  std::uint64_t logBytes;          // the write-ahead log is copied into the database at this size
-  std::uint64_t transactionBytes;  // payloads in one transaction
-  std::uint64_t payloadBytes;      // a longer one is not stored
+  std::uint64_t databaseBytes;     // above this size the oldest records are deleted
+  std::uint64_t logBytes;          // at this size the write-ahead log is copied into the database
+  std::uint64_t transactionBytes;  // the most payload in one transaction
+  std::uint64_t payloadBytes;      // the longest payload; longer ones are dropped and counted
 
   static StoreSizes of(std::uint32_t maxMegabytes);
 };
 
-// Opens the store's database for writing, and makes it, its directory and its tables if needed.
-// A damaged one is set aside and reported with an error line, and a new one made. One of a newer
-// version is left exactly as it is. Blocks on the disk, and on other users of the file for a while.
+// Opens the store's database for writing. Creates the directory, the file and the tables that are
+// missing, and migrates an older schema. Renames a damaged database, logs an error and starts with
+// an empty one. Leaves a database of a newer version untouched and returns an error.
+//
+// Blocks on the disk: up to 2 seconds for the check of the file, and up to 250 ms for each lock
+// that another process holds. `files` and `database` belong to the caller.
 [[nodiscard]] std::optional<StoreError> openStoreDatabase(StoreFiles& files,
                                                           const StoreSizes& sizes,
                                                           Database& database);
 
-// Closes a database without copying its write-ahead log back, so that its files stay as they are.
+// Closes a database without copying its write-ahead log into it, so that damaged files stay as
+// they are for whoever examines them. Does nothing when the database is not open.
 void abandon(Database& database);
 
-// Whether that result means that the file's content is broken.
+// Returns true when the code says that the content of the file is broken.
 [[nodiscard]] bool meansDamage(SqliteCode code);
 
 }  // namespace halvox::platform::linux_

@@ -15,7 +15,7 @@ using ::testing::SizeIs;
 
 class StoreOpeningTest : public StoreTest {
  protected:
-  // A store with some thousand events, closed in good order.
+  // Makes a store with 4,000 events and closes it in good order.
   void makeStore() {
     start();
     for (std::int64_t number = 0; number < 4000; ++number) send(number);
@@ -132,7 +132,7 @@ TEST_F(StoreOpeningTest, TakesAnEmptyFileForANewStore) {
   EXPECT_THAT(setAsideFiles(), IsEmpty());
 }
 
-TEST_F(StoreOpeningTest, KeepsTheEventsOfADatabaseWhoseLogIsGarbage) {
+TEST_F(StoreOpeningTest, KeepsTheEventsWhenTheLogIsGarbage) {
   makeStore();
   writeFile(database().native() + "-wal", std::string(100'000, '\x5A'));
   start();
@@ -150,7 +150,7 @@ TEST_F(StoreOpeningTest, SetsALogWithoutItsDatabaseAside) {
   EXPECT_THAT(setAsideFiles(), SizeIs(1));
 }
 
-TEST_F(StoreOpeningTest, SaysThatADirectoryIsInThePlaceOfTheDatabase) {
+TEST_F(StoreOpeningTest, RefusesADirectoryInPlaceOfTheDatabase) {
   std::filesystem::create_directories(database());
   const auto error = open();
   ASSERT_TRUE(error.has_value());

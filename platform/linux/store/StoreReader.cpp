@@ -17,7 +17,7 @@ namespace {
 
 constexpr std::chrono::milliseconds kBusyTimeout{1000};
 
-// A URI by which SQLite takes the file as it is, without its log and without locks.
+// Returns a URI that makes SQLite read the file alone, without its log and without locks.
 std::string immutableURI(const std::string& path) {
   std::string uri = "file:";
   for (const char character : path) {
@@ -45,10 +45,11 @@ std::optional<StoreError> StoreReader::open(const std::filesystem::path& directo
     return StoreError{kind,
                       files_->database().native() + ": " + std::system_category().message(errno)};
   }
-  // A pipe could keep us waiting for ever.
+  // Opening a pipe would block until somebody writes to it.
   if (!S_ISREG(status.st_mode)) {
     return StoreError{StoreError::Kind::kCannotOpen,
-                      files_->database().native() + ": expected a regular file, found another"};
+                      files_->database().native() +
+                          ": expected a regular file, found a directory, a pipe or a device"};
   }
   auto error = openDatabase();
   if (error.has_value()) {
@@ -66,13 +67,13 @@ std::optional<StoreError> StoreReader::openDatabase() {
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   const std::string& path = files_->database().native();
   if (*version == 0) {
-    return StoreError{StoreError::Kind::kMissing, path + ": nothing was stored yet"};
+    return StoreError{StoreError::Kind::kMissing, path + ": nothing has been stored yet"};
   }
   if (*version <= kStoreSchemaVersion) return std::nullopt;
-  return StoreError{StoreError::Kind::kNewerVersion, path + ": the database has version " +
-                                                         std::to_string(*version) +
-                                                         ", this program knows versions up to " +
-                                                         std::to_string(kStoreSchemaVersion)};
+  return StoreError{StoreError::Kind::kNewerVersion,
+                    path + ": expected a database of version " +
+                        std::to_string(kStoreSchemaVersion) + " or older, found version " +
+                        std::to_string(*version) + ", made by a newer release"};
 }
 
 SqliteCode StoreReader::openFile() {
@@ -80,13 +81,14 @@ SqliteCode StoreReader::openFile() {
     SqliteCode code = database_.open(file, DatabaseAccess::kReadOnly);
     if (code != SQLITE_OK) return code;
     sqlite3_busy_timeout(database_.get(), static_cast<int>(kBusyTimeout.count()));
-    // The first statement that reads the file finds out whether it can be read.
+    // SQLite reads the file only when a statement needs it. This one shows whether it can.
     return database_.execute("PRAGMA schema_version");
   };
   const std::string& path = files_->database().native();
   const SqliteCode code = attempt(path);
-  // Somebody who may read but not write beside the file cannot take part in its log; a file that
-  // was closed in good order has none and can be read as it is.
+  // Reading a WAL database takes its -shm file, which a user who may only read cannot create. Such
+  // a user can still read a database that was closed in good order: without a log, the file alone
+  // is complete.
   const bool needsLog = (code & 0xFF) == SQLITE_CANTOPEN || (code & 0xFF) == SQLITE_READONLY;
   return needsLog && files_->logBytes() == 0 ? attempt(immutableURI(path)) : code;
 }
@@ -111,7 +113,7 @@ std::optional<StoreError> StoreReader::forEachRecord(const RecordTable& table,
                                                      const RecordFilter& filter,
                                                      const RecordCallback& callback) {
   if (!database_.isOpen()) return StoreError{StoreError::Kind::kMissing, "no store is open"};
-  // Asked each time, because a service may have migrated the store meanwhile.
+  // Read for each call: a service may have migrated the store since it was opened.
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   if (*version < table.sinceVersion) return std::nullopt;
@@ -134,7 +136,7 @@ StoreError StoreReader::failure(SqliteCode code) const {
   const bool damaged = meansDamage(code);
   return {damaged ? StoreError::Kind::kDamaged : StoreError::Kind::kCannotOpen,
           files_->database().native() +
-              (damaged ? ": the database is damaged: " : ": the database cannot be read: ") +
+              (damaged ? ": the database is damaged: " : ": cannot read the database: ") +
               database_.errorText()};
 }
 

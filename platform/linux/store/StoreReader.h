@@ -16,29 +16,28 @@
 
 namespace halvox::platform::linux_ {
 
-// The place of a record in the order in which those of its kind were stored. Numbers only grow,
-// with gaps.
+// The position of a record among those of its kind, in the order of storing. IDs only grow and may
+// have gaps. They start again from 1 when a new database takes the place of the old one.
 using StoredRecordID = std::int64_t;
 
-// Only records in whose column stands one of the numbers.
+// Selects the records that have one of the numbers in a column.
 struct NumberMatch {
-  std::size_t column;  // of the kind's RecordTable
+  std::size_t column;  // index into RecordTable::columns
   std::vector<std::int64_t> numbers;
 };
 
-// Which records to read; what is not set does not restrict.
+// Which records to read. A member that is not set selects everything.
 struct RecordFilter {
-  // Glob patterns as fnmatch(3) understands them, of which one must match, for the kinds that have
-  // a name.
+  // Patterns for fnmatch(3). The name must match at least one; kinds without a name ignore them.
   std::vector<std::string> names{};
-  std::optional<double> since{};          // seconds since 1970, included
-  std::optional<double> until{};          // seconds since 1970, not included
-  StoredRecordID after = 0;               // only records stored later than this one
-  std::optional<std::uint64_t> newest{};  // only so many, the newest
-  std::vector<NumberMatch> numbers{};     // for the kinds that have a RecordTable
+  std::optional<double> since{};          // seconds since 1970, inclusive
+  std::optional<double> until{};          // seconds since 1970, exclusive
+  StoredRecordID after = 0;               // only records stored after this one
+  std::optional<std::uint64_t> newest{};  // at most this many, the newest
+  std::vector<NumberMatch> numbers{};     // all must match; events ignore them
 };
 
-// An event as it is stored. The views are valid during the callback.
+// A stored event. Its views are valid during the callback only.
 struct StoredEvent {
   StoredRecordID id;
   double time;  // seconds since 1970
@@ -46,7 +45,8 @@ struct StoredEvent {
   std::string_view payload;  // JSON text
 };
 
-// A record of another kind: what stands in the columns of its RecordTable, in their order.
+// A stored record of any other kind. `fields` has the values of RecordTable::columns, in order;
+// bytes are in a std::string.
 struct StoredRecord {
   using Field = std::variant<std::int64_t, std::string>;
   StoredRecordID id;
@@ -61,29 +61,34 @@ struct StoredRecord {
   }
 };
 
-// Reads a store, while a service writes to it or when none runs, and never changes it.
-// Belongs to one thread. Holds no lock and no snapshot while a callback runs, so a slow reader does
-// not keep the service from tidying up its files.
+// Reads a store without changing it, whether or not a service writes to it at the same time.
+// Belongs to one thread and one owner. Errors are returned; the reader can be opened again after
+// any of them.
+//
+// Reads in pieces and holds no lock and no snapshot while a callback runs. A snapshot would keep
+// the service from starting its write-ahead log anew, and a slow reader would make the log grow.
 class StoreReader {
  public:
   using EventCallback = std::function<void(const StoredEvent&)>;
   using RecordCallback = std::function<void(const StoredRecord&)>;
 
-  // Opens the store in that directory: kMissing when there is none, kDamaged, kNewerVersion or
-  // kCannotOpen. May be called again, after an error or for another directory.
+  // Opens the store in `directory`, and closes the one that was open. Fails with kMissing when
+  // there is none or nothing was stored yet, kDamaged, kNewerVersion or kCannotOpen.
   [[nodiscard]] std::optional<StoreError> open(const std::filesystem::path& directory);
 
-  // Calls back for each event that passes the filter, in the order of storing, newest last. Waits
-  // for the database at most a second, should it be locked.
+  // Calls `callback` on this thread for each event that passes the filter, oldest first in the
+  // order of storing. Delivers what was stored when the call began. Waits up to one second for a
+  // locked database. After an error, the events before it have been delivered.
   [[nodiscard]] std::optional<StoreError> forEachEvent(const RecordFilter& filter,
                                                        const EventCallback& callback);
-  // The same for another kind. A store of a version that did not have the kind yet has none.
+  // The same for the records of another kind. A store of an older version that lacks the kind has
+  // no such records, which is not an error.
   [[nodiscard]] std::optional<StoreError> forEachRecord(const RecordTable& table,
                                                         const RecordFilter& filter,
                                                         const RecordCallback& callback);
 
-  // True when none is open, or the store's path leads to another database than it did, or to none;
-  // then opening again helps, and event numbers may begin anew.
+  // Returns true when no store is open, or the path now leads to another database or to none. Call
+  // open() again; record IDs may then start from 1.
   [[nodiscard]] bool isReplaced() const;
 
  private:

@@ -16,7 +16,7 @@ using ::testing::SizeIs;
 
 class StoreReaderTest : public StoreTest {
  protected:
-  // Events 0 to count - 1, a second apart from time 1,000 on, named "even" and "odd".
+  // Stores events 0 to count - 1, one second apart from time 1,000, named "even" and "odd".
   void store1000(std::int64_t count) {
     start();
     for (std::int64_t number = 0; number < count; ++number) {
@@ -118,7 +118,7 @@ TEST_F(StoreReaderTest, GivesOneOfTheTwoEventsOfAMessage) {
   EXPECT_THAT(read({.names = {"second"}}), SizeIs(1));
 }
 
-TEST_F(StoreReaderTest, ReadsOnAfterAnEvent) {
+TEST_F(StoreReaderTest, ReadsFromAGivenEventOn) {
   store1000(5);
   StoreReader reader;
   ASSERT_EQ(reader.open(options.directory), std::nullopt);
@@ -164,7 +164,7 @@ TEST_F(StoreReaderTest, SaysThatNothingWasStoredYet) {
   EXPECT_EQ(openError(), StoreError::Kind::kMissing);
 }
 
-TEST_F(StoreReaderTest, APipeInThePlaceOfTheFileKeepsNobodyWaiting) {
+TEST_F(StoreReaderTest, RefusesAPipeInPlaceOfTheFileWithoutWaiting) {
   std::filesystem::create_directories(options.directory);
   ASSERT_EQ(::mkfifo((options.directory / "halvox.db").c_str(), 0600), 0);
 

@@ -11,8 +11,12 @@
 
 namespace halvox::platform::linux_ {
 
-// The records of the store that are written as they come. `time` is seconds since 1970; payloads
-// are turned into text by the writer.
+// The records that are stored one to a row, as callers queue them: plain values. `time` is seconds
+// since 1970. Payloads wait as dictionaries; the writer encodes them, which keeps JSON off the
+// callers' threads.
+//
+// `bind` gives the columns of a record to the statement that inserts it and returns the number of
+// bytes that count against the transaction. The record must outlive the statement's run.
 
 struct IssueMetricRecord {
   static constexpr const RecordTable& table = kIssueMetrics;
@@ -33,7 +37,7 @@ struct PowerEventRecord {
   std::size_t bind(Statement& statement, int firstColumn, PayloadEncoder& encoder) const;
 };
 
-// Who sends through the link: the same for all messages of one session.
+// The sender of link messages. All messages of one session share one.
 struct LinkParty {
   std::int64_t sessionID = 0;
   std::string clientName;
@@ -43,7 +47,7 @@ struct LinkParty {
 struct LinkMessageRecord {
   static constexpr const RecordTable& table = kLinkMessages;
   double time = 0;
-  std::shared_ptr<const LinkParty> party;  // shared by the session and its waiting messages
+  std::shared_ptr<const LinkParty> party;  // held by the session and by its waiting messages
   std::uint16_t category = 0;
   std::uint16_t type = 0;
   Dictionary payload{};

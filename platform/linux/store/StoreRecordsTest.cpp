@@ -21,7 +21,7 @@ using ::testing::SizeIs;
 constexpr double kNow = 1'700'000'000;
 constexpr double kDay = 86'400;
 
-// A message of one field, as a metric's back-end has it.
+// A metric with one field, encoded as the metric back-end encodes its messages.
 class OneField final : public ProtoBase {
  public:
   bool readFrom(ProtoReader& /*reader*/) override { return true; }
@@ -54,7 +54,7 @@ class StoreRecordsTest : public StoreTest {
   [[nodiscard]] std::vector<std::string> stored(std::string_view sql) const {
     return rows(database(), sql);
   }
-  // The payloads of link messages that pass the filter.
+  // Returns the payloads of the link messages that pass the filter.
   std::vector<std::string> readLink(const RecordFilter& filter) {
     std::vector<std::string> texts;
     StoreReader reader;
@@ -122,7 +122,7 @@ TEST_F(StoreRecordsTest, OrderIsKeptOverManyTransactions) {
 }
 
 TEST_F(StoreRecordsTest, CountersBalanceForEachKind) {
-  options.maxMegabytes = 1;  // then a payload may have a quarter of it
+  options.maxMegabytes = 1;  // a payload may be a quarter of this
   start();
   sendLink(1, 1);
   sendLink(1, 2, kNow, std::string(300'000, 'x'));
@@ -134,7 +134,7 @@ TEST_F(StoreRecordsTest, CountersBalanceForEachKind) {
   EXPECT_THAT(stored("SELECT json_extract(payload, '$.n') FROM link_messages"), ElementsAre("1"));
 }
 
-TEST_F(StoreRecordsTest, WhatComesAfterTheEndIsCounted) {
+TEST_F(StoreRecordsTest, RecordsAfterClosingAreCountedAsDropped) {
   start();
   store->close();
   sendLink(1, 1);
@@ -177,7 +177,7 @@ TEST_F(StoreRecordsTest, AgeAppliesToEveryKind) {
               ElementsAre("0|0|0"));
 }
 
-TEST_F(StoreRecordsTest, FloodOfOneKindDoesNotDriveOutYoungerOnesOfAnother) {
+TEST_F(StoreRecordsTest, FloodOfOneKindDoesNotDisplaceNewerRecordsOfAnother) {
   options.maxMegabytes = 1;
   start();
   store->powerEvents().add({.time = kNow - 10, .categoryID = 1, .eventName = "old"});
@@ -195,7 +195,7 @@ TEST_F(StoreRecordsTest, FloodOfOneKindDoesNotDriveOutYoungerOnesOfAnother) {
   EXPECT_LE(std::filesystem::file_size(database()), 1U << 20U);
 }
 
-TEST_F(StoreRecordsTest, NumbersGrowThoughAllRecordsWereDeleted) {
+TEST_F(StoreRecordsTest, NumbersGrowAfterAllRecordsWereDeleted) {
   start();
   sendLink(1, 1, kNow - 31 * kDay);
   stop();
@@ -223,7 +223,7 @@ TEST_F(StoreRecordsTest, FiltersBySessionNameTimeAndCount) {
   EXPECT_THAT(readLink({.names = {"voice*"}}), IsEmpty());
 }
 
-TEST_F(StoreRecordsTest, ReadsAllOfAManyPieceScan) {
+TEST_F(StoreRecordsTest, ReadsRecordsOfManyPieces) {
   start();
   for (std::int64_t number = 0; number < 3000; ++number) sendLink(1, number);
   stop();
@@ -251,7 +251,7 @@ TEST_F(StoreRecordsTest, FollowerDeliversEachRecordOnce) {
   EXPECT_THAT(delivered, ElementsAre("{\"n\":1}", "{\"n\":2}"));
 }
 
-// What version 1 made, when it had stored one event.
+// A store of schema version 1 with one event.
 constexpr const char* kVersion1 = R"sql(
 PRAGMA page_size = 8192; PRAGMA auto_vacuum = INCREMENTAL; PRAGMA journal_mode = WAL;
 CREATE TABLE event_names(
@@ -312,7 +312,7 @@ TEST_F(StoreRecordsTest, ReaderFindsNoneInAStoreOfTheFirstVersion) {
   EXPECT_THAT(events, ElementsAre(numbered(1)));
 }
 
-TEST_F(StoreRecordsTest, TablesAreNamedAsOtherProgramsKnowThem) {
+TEST_F(StoreRecordsTest, ViewsHaveTheNamesThatOtherProgramsUse) {
   start();
   stop();
   EXPECT_THAT(stored("SELECT time, name, payload FROM analytics_events"

@@ -9,14 +9,16 @@ namespace halvox::platform::linux_ {
 
 constexpr std::string_view kStoreFileName = "halvox.db";
 
-// Records whose times one row of a table of spans sums up: span = record number / this.
+// The number of records that one row of a table of spans summarises. Record `id` is in span
+// `id / kRecordsPerSpan`. Stored rows depend on this number: a change needs a migration.
 constexpr std::int64_t kRecordsPerSpan = 512;
 
-// The version that this program writes, kept in `PRAGMA user_version`.
+// The schema version that this program writes, stored in `PRAGMA user_version`.
 extern const std::int64_t kStoreSchemaVersion;
 
-// Brings a database of an older version, or an empty one, to the current version: each step in a
-// transaction of its own. SQLITE_OK or an error; what was done before it is kept.
+// Migrates an empty or older database to the current version, one transaction a step. On an error
+// it rolls the failed step back, keeps the steps before it and returns the code; the next call
+// continues there. The database must not be newer than kStoreSchemaVersion.
 [[nodiscard]] SqliteCode migrate(Database& database);
 
 }  // namespace halvox::platform::linux_

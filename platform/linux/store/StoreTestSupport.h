@@ -18,10 +18,10 @@
 
 namespace halvox::platform::linux_ {
 
-// Waits until it holds, looking every millisecond; false after ten seconds.
+// Tests the condition every millisecond until it holds. Returns false after ten seconds.
 [[nodiscard]] bool eventually(const std::function<bool()>& holds);
 
-// The rows of a query as the columns' texts joined by '|', read by a connection of its own.
+// Runs a query on a connection of its own. Returns each row as its columns joined by '|'.
 [[nodiscard]] std::vector<std::string> rows(const std::filesystem::path& database,
                                             std::string_view sql);
 void execute(const std::filesystem::path& database, const std::string& sql);
@@ -29,16 +29,17 @@ void execute(const std::filesystem::path& database, const std::string& sql);
 [[nodiscard]] std::string readFile(const std::filesystem::path& path);
 void writeFile(const std::filesystem::path& path, std::string_view content);
 
-// A store in a scratch directory, over fakes, with a service for events.
+// A fixture with a store in a scratch directory, fake platform services, and a service that sends
+// events to the store.
 class StoreTest : public ::testing::Test {
  protected:
   StoreTest() { options.directory = scratch.path() / "state" / "halvox"; }
 
-  // Makes a store of the options and opens it.
+  // Makes a store with `options` and opens it.
   [[nodiscard]] std::optional<StoreError> open();
-  // The same, and expects it to succeed.
-  void start() { ASSERT_EQ(open(), std::nullopt) << "the store does not open"; }
-  // Drains and closes the store.
+  // The same; fails the test on an error.
+  void start() { ASSERT_EQ(open(), std::nullopt) << "cannot open the store"; }
+  // Writes what waits and closes the store.
   void stop() { store.reset(); }
 
   // Sends an event whose payload is {"number": number}.
@@ -52,7 +53,7 @@ class StoreTest : public ::testing::Test {
   [[nodiscard]] std::uint64_t counted(std::string_view name) const {
     return platform.statistics.value("analytics", name);
   }
-  // The sum of all that was dropped, for whatever reason.
+  // The number of events that were dropped for any reason.
   [[nodiscard]] std::uint64_t dropped() const;
 
   ScratchDirectory scratch;

@@ -6,6 +6,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
+// A commit has a fixed cost. In smaller batches it dominates, and the time per record says nothing
+// about a flood.
 constexpr std::uint64_t kTellingRecords = 256;
 
 }  // namespace
@@ -84,7 +86,7 @@ bool WriterQueue::noteAdded() {
   if (waiting_ >= softRecords_ && !backpressure_.isHigh()) backpressure_.raise();
   const bool wake =
       writer_ == Writer::kIdle || (writer_ == Writer::kGathering && queued_ >= gatherRecords_);
-  // Woken once is enough, however many come before it runs.
+  // One wake-up is enough, however many records come before the writer runs.
   if (wake) writer_ = Writer::kWorking;
   return wake;
 }
@@ -93,9 +95,10 @@ void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {
   if (records == 0) return;
   const Time now = std::chrono::steady_clock::now();
   const std::chrono::nanoseconds elapsed = now - std::exchange(workingSince_, now);
-  // Estimates rise at once and fall slowly: what waits is more likely like the worst seen lately.
+  // The estimates rise at once and fall by at most a quarter a batch. Too high a limit breaks the
+  // promised half second; too low a limit only slows callers for a moment.
   bytesPerRecord_ = std::max(bytes / records, bytesPerRecord_ - bytesPerRecord_ / 4);
-  // A commit costs the same however little is in it, so small ones tell nothing about a flood.
+  // A small batch counts after all when it took as long as a full queue may.
   if (records >= kTellingRecords || elapsed >= limits_.softTime) {
     timePerRecord_ =
         std::max(elapsed / static_cast<std::int64_t>(records), timePerRecord_ - timePerRecord_ / 4);
@@ -104,7 +107,7 @@ void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {
   const auto byTime = static_cast<std::uint64_t>(
       limits_.softTime / std::max(timePerRecord_, std::chrono::nanoseconds(1)));
   softRecords_ = std::clamp<std::uint64_t>(std::min(bySize, byTime), 1, limits_.softRecords);
-  // Gathering must end before callers have to wait.
+  // At half the soft limit the writer starts, before backpressure slows the connections.
   gatherRecords_ = std::clamp<std::uint64_t>(softRecords_ / 2, 1, limits_.gatherRecords);
 }
 

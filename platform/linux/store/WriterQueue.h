@@ -9,35 +9,44 @@
 
 namespace halvox::platform::linux_ {
 
-// How many records may wait. Payloads are built when they are written, so bytes and time are known
-// only then: the sizes of the last payloads, and how long writing took, stand for those that wait.
+// How many records may wait. The writer builds payloads when it writes them, so the size of a
+// waiting record and the time that it will take are not known yet. The queue estimates both from
+// the records written last, and applies whichever of the three soft limits is reached first.
+//
+// At the soft limit connections are read more slowly; at the hard limit callers wait. With these
+// values the hard limit is 4 x 75 ms of writing. Together with gathering this leaves room within
+// the half second in which a record must be in the database.
 struct QueueLimits {
   std::uint64_t softRecords = 8192;
-  std::uint64_t softBytes = 16U << 20U;
-  std::chrono::milliseconds softTime{75};
-  std::uint64_t hardFactor = 4;  // at so many times the soft limit callers wait
+  std::uint64_t softBytes = 16U << 20U;    // of payload
+  std::chrono::milliseconds softTime{75};  // of writing
+  std::uint64_t hardFactor = 4;            // the hard limit as a multiple of the soft limit
 
   std::chrono::milliseconds gatherTime{20};
-  std::uint64_t gatherRecords = 4096;
+  std::uint64_t gatherRecords = 4096;  // as many as fit into one transaction
 };
 
-// The meeting point of the callers and the store's writer: counts what waits, wakes the writer as
-// seldom as it may, and makes callers wait when too much waits. The records themselves are with
-// their kinds, which move them under this queue's lock.
+// Connects the threads that add records with the store's writer: counts waiting records, wakes the
+// writer as seldom as possible, and makes callers wait when too many wait. The records themselves
+// are in their RecordKind, which moves them while it holds this queue's lock: one lock for all
+// kinds, and one wake-up.
 //
-// The writer sleeps without a timer while nothing waits. The first record wakes it. Records that
-// come within `gatherTime` of its last round are gathered until that time is over or
-// `gatherRecords` wait, so that a busy service commits seldom and wakes nobody for single records.
+// The writer sleeps without a timer while nothing waits. The first record wakes it. When the first
+// record comes within `gatherTime` of the last round, the writer waits until that time is over or
+// `gatherRecords` wait. A busy service thus commits seldom and does not wake the writer for every
+// record.
+//
+// Owned by the store. Cannot fail.
 class WriterQueue {
  public:
   using Time = std::chrono::steady_clock::time_point;
 
-  // Does not own `backpressure`, which must outlive it: raised above the soft limit, relieved below
-  // a quarter of it.
+  // Raises `backpressure` at the soft limit and relieves it below a quarter of it, so that it does
+  // not flutter. Does not own it; it must outlive the queue.
   WriterQueue(const QueueLimits& limits, Backpressure& backpressure);
 
-  // Any thread. Runs `append` under the lock, once there is room; false, and nothing was run, when
-  // the queue is closed.
+  // Any thread. Waits for room, then runs `append` under the lock and returns true. Returns false
+  // without running it when the queue is closed. `append` must not block or throw.
   template <typename Append>
   bool add(Append&& append) HALVOX_EXCLUDES(mutex_) {
     bool wake = false;
@@ -51,21 +60,23 @@ class WriterQueue {
     if (wake) work_.notifyOne();
     return true;
   }
-  // Any thread. Lets the writer finish what waits and refuses all that comes later.
+  // Any thread. Refuses new records and frees callers that wait for room. The writer still takes
+  // the records that are queued.
   void close() HALVOX_EXCLUDES(mutex_);
 
-  // The writer: waits for records, at least until `notBefore` unless many wait, then runs `take`
-  // under the lock, which must take all that is queued. False when the queue is closed and empty.
+  // Writer only. Waits for a record, then until `notBefore` or until `gatherRecords` wait, and runs
+  // `take` under the lock. `take` must take everything that is queued. Returns false, without
+  // running it, when the queue is closed and empty.
   bool take(Time notBefore, const std::function<void()>& take) HALVOX_EXCLUDES(mutex_);
-  // The writer: so many of the taken records are done with; `bytes` were in their payloads. It was
-  // at work on them since the last call of this or of take().
+  // Writer only. `records` of the taken records left the store's memory, with payloads of `bytes`.
+  // The queue attributes the time since the last take(), finish() or disregardTime() to them.
   void finish(std::uint64_t records, std::uint64_t bytes) HALVOX_EXCLUDES(mutex_);
-  // The writer: the time since then went by in a failure and says nothing about writing.
+  // Writer only. The time so far was spent on a failure: finish() must not count it as writing.
   void disregardTime() HALVOX_EXCLUDES(mutex_);
-  // The writer: whether records came since the last take().
+  // Writer only. Returns true when records came after the last take().
   [[nodiscard]] bool hasQueued() HALVOX_EXCLUDES(mutex_);
 
-  // Records that were added and are not done with.
+  // Any thread. The number of records that were added and are not finished.
   [[nodiscard]] std::uint64_t waiting() HALVOX_EXCLUDES(mutex_);
   [[nodiscard]] const QueueLimits& limits() const { return limits_; }
 
@@ -88,7 +99,7 @@ class WriterQueue {
   std::uint64_t bytesPerRecord_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::chrono::nanoseconds timePerRecord_ HALVOX_GUARDED_BY(mutex_){};
   Time workingSince_ HALVOX_GUARDED_BY(mutex_);
-  // The limits as the last payloads make them.
+  // The limits in records, derived from the estimates.
   std::uint64_t softRecords_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t gatherRecords_ HALVOX_GUARDED_BY(mutex_);
   bool closed_ HALVOX_GUARDED_BY(mutex_) = false;

@@ -32,7 +32,7 @@ TEST(WriterQueueTest, RaisesBackpressureAtTheSoftLimit) {
   EXPECT_TRUE(backpressure.isHigh());
 }
 
-TEST(WriterQueueTest, RelievesBackpressureBelowAQuarterAndSaysSo) {
+TEST(WriterQueueTest, RelievesBackpressureBelowAQuarterAndCallsTheHandler) {
   Backpressure backpressure;
   int reliefs = 0;
   backpressure.setReliefHandler([&] { ++reliefs; });
@@ -78,7 +78,7 @@ TEST(WriterQueueTest, HoldsFewerRecordsWhenTheirPayloadsAreLarge) {
   EXPECT_TRUE(backpressure.isHigh());
 }
 
-TEST(WriterQueueTest, HoldsAsManyRecordsWhenTimeWentByInAFailure) {
+TEST(WriterQueueTest, TimeSpentOnAFailureDoesNotLowerTheLimit) {
   Backpressure backpressure;
   WriterQueue queue(kSmall, backpressure);
   addMany(queue, 1);
@@ -100,7 +100,7 @@ TEST(WriterQueueTest, HoldsFewerRecordsWhenWritingIsSlow) {
   std::this_thread::sleep_for(kSmall.softTime);  // the slow writing
   queue.finish(4, 0);
 
-  // Four take more than the soft time, so four are too many.
+  // Four records took longer than the soft time, so four waiting records are too many.
   addMany(queue, 4);
   EXPECT_TRUE(backpressure.isHigh());
 }
@@ -131,13 +131,13 @@ TEST(WriterQueueTest, EndsGatheringWhenItsTimeIsOver) {
   EXPECT_GE(std::chrono::steady_clock::now(), limit);
 }
 
-TEST(WriterQueueTest, LetsTheWriterFinishAfterClosingAndRefusesWhatComesLater) {
+TEST(WriterQueueTest, ClosingLetsTheWriterFinishAndRefusesNewRecords) {
   Backpressure backpressure;
   WriterQueue queue(kSmall, backpressure);
   addMany(queue, 2);
 
   queue.close();
-  EXPECT_FALSE(queue.add([] { FAIL() << "was run though the queue is closed"; }));
+  EXPECT_FALSE(queue.add([] { FAIL() << "append ran although the queue is closed"; }));
   EXPECT_TRUE(queue.take(never(), [] {}));
   queue.finish(2, 0);
   EXPECT_FALSE(queue.take(never(), [] {}));
@@ -153,11 +153,11 @@ TEST(WriterQueueTest, ClosingFreesCallersThatWaitForRoom) {
   caller.join();
 }
 
-TEST(WriterQueueTest, CountsWhatManyThreadsAddAtOnce) {
+TEST(WriterQueueTest, CountsRecordsThatManyThreadsAddAtOnce) {
   Backpressure backpressure;
   WriterQueue queue(kSmall, backpressure);
   constexpr std::uint64_t kEach = 2000;
-  std::uint64_t inside = 0;  // under the queue's lock
+  std::uint64_t inside = 0;  // guarded by the queue's lock
   std::vector<std::thread> callers;
   for (int caller = 0; caller < 4; ++caller) {
     callers.emplace_back([&] {
