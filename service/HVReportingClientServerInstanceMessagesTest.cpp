@@ -270,6 +270,13 @@ TEST_F(HVReportingClientServerInstanceMessagesTest, StandaloneStepsInOrder) {
                   "deallocing this session 1", "sendMessage"));
 }
 
+TEST_F(HVReportingClientServerInstanceMessagesTest, StandaloneIsANotableEvent) {
+  sendToAll(client_);
+
+  EXPECT_THAT(lines(LogLevel::kDefault),
+              testing::Contains("no active reporting sessions found, sending as standalone"));
+}
+
 TEST_F(HVReportingClientServerInstanceMessagesTest, StandaloneSendsOneSingleMessageASecondLater) {
   sendToAll(client_);
   EXPECT_THAT(platform_.dispatch.delays(), ElementsAre(std::chrono::nanoseconds(1s)));

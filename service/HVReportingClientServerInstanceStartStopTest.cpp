@@ -172,6 +172,16 @@ TEST_F(HVReportingClientServerInstanceStartStopTest, StopStepsInOrder) {
   EXPECT_THAT(lines(LogLevel::kDefault).back(), "stopping 7");
 }
 
+TEST_F(HVReportingClientServerInstanceStartStopTest, StopLogsEachRequestAtDebugLevel) {
+  createAndStart(client_, 7);
+  forgetSteps();
+
+  stop(client_, 7);
+
+  EXPECT_THAT(lines(LogLevel::kDebug), ElementsAre("stopping session for reporter 7",
+                                                   "ending session 7", "ending session 7"));
+}
+
 TEST_F(HVReportingClientServerInstanceStartStopTest, StopOfASessionThatIsNotStartedOnlyReplies) {
   create(client_, 7);
   forgetSteps();

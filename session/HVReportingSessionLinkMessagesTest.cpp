@@ -108,6 +108,22 @@ TEST_F(HVReportingSessionLinkMessagesTest, ARedundantMessageIsNotSent) {
   EXPECT_EQ(platform_.statistics.value("link", "suppressed: redundant"), 1U);
 }
 
+TEST_F(HVReportingSessionLinkMessagesTest, ATestSessionThatIsNotStartedSendsASingleMessage) {
+  session_->setServiceType(AudioServiceType::kTest);
+
+  send({{"a", 1}});
+  run();
+  platform_.dispatch.advance(1s);
+
+  ASSERT_EQ(framework_.singleMessages().size(), 1U);
+  EXPECT_EQ(framework_.singleMessages()[0].payload,
+            (Dictionary{{"a", 1}, {"audiotag", "PlaybackStart"}}));
+  EXPECT_EQ(*framework_.singleMessageInfos().at(0).userInfo.find("TLMReportingUserInfoServiceName"),
+            platform::Value("test"));
+  EXPECT_THAT(platform_.statistics.values("link"),
+              UnorderedElementsAre(Pair("received", 1U), Pair("handed on: single message", 1U)));
+}
+
 TEST_F(HVReportingSessionLinkMessagesTest, ASessionThatBecameATestSendsNoMore) {
   open();
   session_->setServiceType(AudioServiceType::kTest);

@@ -1,5 +1,6 @@
 #include "session/HVReportingSession.h"
 
+#include <atomic>
 #include <memory>
 #include <string>
 #include <thread>
@@ -369,6 +370,32 @@ TEST_F(HVReportingSessionTest, RepetitionsUnderAnotherCodeOfTheSameTextAreCharge
   EXPECT_EQ(account->use().bytes, (*session->nestedAggregatedPayloadData())->memorySize());
   session->stop();
   EXPECT_EQ(account->use().bytes, 0U);
+}
+
+// Another thread never finds a history at a session that is not started: it comes after the flag is
+// set and goes before the flag is cleared. Whoever holds the history holds up its end, so the flag
+// is read where a wrong order would show.
+TEST_F(HVReportingSessionTest, AHistoryIsOnlyThereWhileTheSessionIsStarted) {
+  constexpr int kEnough = 2000;
+  const auto session = makeSession();
+  platform_.log.setLevel(LogLevel::kError);
+  std::atomic<int> seen{0};
+  std::atomic<int> wrong{0};
+  const std::jthread reader([&](const std::stop_token& stop) {
+    while (!stop.stop_requested()) {
+      const auto history = session->nestedAggregatedPayloadData();
+      if (!history->has_value()) continue;
+      if (!session->started()) ++wrong;
+      ++seen;
+    }
+  });
+
+  while (seen < kEnough) {
+    session->start();
+    session->stop();
+  }
+
+  EXPECT_EQ(wrong, 0);
 }
 
 // Runs under ThreadSanitizer: payloads are built from sessions on other threads.

@@ -220,6 +220,25 @@ TEST_F(HVReportingSessionTracingTest, FrameworkTraceEndsWithItsURL) {
             (Texts{"Performance Trace Stopped", "Performance Trace Completed: /traces/one"}));
 }
 
+// Whoever waits for the trace goes on at the signal: the trace is forgotten before, and its URL
+// comes after.
+TEST_F(HVReportingSessionTracingTest, CompletionForgetsTheTraceThenSignalsThenStoresTheURL) {
+  session_->start();
+  forgetWhatHappened();
+  std::vector<std::optional<std::string>> urls;
+  platform_.dispatch.whenSignalled([&] {
+    urls.push_back(session_->getKQTraceFileURL());
+    EXPECT_EQ(session_->traceSession(), nullptr);
+    EXPECT_EQ(operations(), Texts{"trace without delegate"});
+    EXPECT_TRUE(platform_.log.lines().empty());
+  });
+
+  platform_.performanceTraces.delegate()->kqTraceDidComplete("file:///one", 0, std::nullopt);
+
+  EXPECT_EQ(urls, (std::vector<std::optional<std::string>>{std::nullopt}));
+  EXPECT_EQ(session_->getKQTraceFileURL(), "file:///one");
+}
+
 TEST_F(HVReportingSessionTracingTest, StartOfATraceIsToldInTheGeneralLogToo) {
   session_->start();
 

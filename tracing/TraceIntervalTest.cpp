@@ -141,6 +141,14 @@ TEST_F(TraceIntervalTest, TicksAreConvertedBeforeTheyAreSubtracted) {
   EXPECT_EQ(anyThread({event(kBegin, 10), event(kEnd, 14)}), Values{500});
 }
 
+// 10 and 14 ticks are 416 and 583 whole nanoseconds, but 4 ticks are 166.
+TEST_F(TraceIntervalTest, EachTickIsConvertedByItself) {
+  platform_.ktrace.setTimebase(125, 3);
+
+  EXPECT_EQ(anyThread({event(kBegin, 10), event(kEnd, 14)}), Values{167});
+  EXPECT_EQ(sameThread({event(kBegin, 10), event(kEnd, 14)}), Values{167});
+}
+
 TEST_F(TraceIntervalTest, EndBeforeItsStartWrapsAround) {
   EXPECT_EQ(anyThread({event(kBegin, 10), event(kEnd, 9)}), Values{UINT64_MAX});
 }

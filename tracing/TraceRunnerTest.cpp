@@ -80,6 +80,22 @@ TEST_F(TraceRunnerTest, RecordsProcessesAndWritesInThisOrder) {
   EXPECT_EQ(TraceRunner::getResultsVersion(), 4U);
 }
 
+TEST_F(TraceRunnerTest, TracesRunOnAQueueOfTheirOwnWithAThreadOfItsOwn) {
+  const auto queues = platform_.dispatch.createdQueues();
+  ASSERT_EQ(queues.size(), 1U);
+  EXPECT_EQ(queues[0].label, "Tracing Queue");
+  EXPECT_EQ(queues[0].quality, platform::QualityOfService::kUtility);
+  EXPECT_EQ(queues[0].threading, platform::QueueThreading::kOwnThread);
+
+  add(params("Startup"));
+  runAndStop();
+
+  // What stops a trace may wait for the tracer.
+  EXPECT_EQ(platform_.dispatch.weights("Tracing Queue"),
+            (std::vector<platform::JobWeight>{platform::JobWeight::kMayBlock,
+                                              platform::JobWeight::kMayBlock}));
+}
+
 TEST_F(TraceRunnerTest, WithoutTracesAnEmptyFileIsWritten) {
   runAndStop();
 

@@ -264,8 +264,22 @@ void FakeDispatchService::setWaiting(FakeDispatchQueue* queue, bool isWaiting) {
   queue->isWaiting_ = isWaiting;
 }
 
-void FakeDispatchService::signal(FakeDispatchSemaphore& semaphore) {
+void FakeDispatchService::whenSignalled(std::function<void()> handler) {
   const std::lock_guard lock(mutex_);
+  signalHandler_ = std::move(handler);
+}
+
+void FakeDispatchService::signal(FakeDispatchSemaphore& semaphore) {
+  std::function<void()> handler;
+  {
+    const std::lock_guard lock(mutex_);
+    addSignal(semaphore);
+    handler = signalHandler_;
+  }
+  if (handler) handler();
+}
+
+void FakeDispatchService::addSignal(FakeDispatchSemaphore& semaphore) {
   const auto first = std::ranges::find_if(
       waits_, [&](const Wait& wait) { return wait.semaphore.get() == &semaphore; });
   if (first == waits_.end()) {

@@ -97,6 +97,8 @@ class FakeDispatchService final : public DispatchService {
   [[nodiscard]] std::size_t waitingQueues() const;
   // How long each delayed job still waits, the next one first.
   [[nodiscard]] std::vector<std::chrono::nanoseconds> delays() const;
+  // Called by whoever signals a semaphore, after each signal: what a thread that waits would find.
+  void whenSignalled(std::function<void()> handler);
   // The traits of every queue that was made, in order.
   [[nodiscard]] std::vector<FakeDispatchQueue::Traits> createdQueues() const;
   // The weights of the jobs added to queues of that label, in order.
@@ -125,6 +127,8 @@ class FakeDispatchService final : public DispatchService {
   void add(std::shared_ptr<FakeDispatchQueue> queue, JobWeight weight, Job job);
   void beginWait(Wait wait);
   void signal(FakeDispatchSemaphore& semaphore);
+  // Under the mutex.
+  void addSignal(FakeDispatchSemaphore& semaphore);
   [[nodiscard]] bool tryTakeSignal(FakeDispatchSemaphore& semaphore);
   void setWaiting(FakeDispatchQueue* queue, bool isWaiting);
   // Under the mutex: lets the queue go on with `then`, in front of its other jobs.
@@ -140,6 +144,7 @@ class FakeDispatchService final : public DispatchService {
   Waits waits_;  // in the order in which they began
   std::chrono::nanoseconds now_{0};
   std::multimap<std::chrono::nanoseconds, Job> delayed_;  // by time; equal times keep their order
+  std::function<void()> signalHandler_;
   std::vector<FakeDispatchQueue::Traits> created_;
   std::multimap<std::string, JobWeight, std::less<>> weights_;
 };

@@ -7,6 +7,8 @@
 namespace halvox::platform {
 namespace {
 
+constexpr std::uint64_t kNanosecondsAtTickZero = 1'000'003;
+
 class FakeSession final : public KtraceSession {
  public:
   std::function<void()> completion;
@@ -33,9 +35,10 @@ void FakeKtraceService::setEvents(std::vector<trace_point> events) {
   events_ = std::move(events);
 }
 
-void FakeKtraceService::setNanosecondsPerTick(std::uint64_t nanoseconds) {
+void FakeKtraceService::setTimebase(std::uint64_t nanoseconds, std::uint64_t ticks) {
   const std::lock_guard lock(mutex_);
-  nanosecondsPerTick_ = nanoseconds;
+  timebaseNanoseconds_ = nanoseconds;
+  timebaseTicks_ = ticks;
 }
 
 void FakeKtraceService::failRange(int error) {
@@ -105,7 +108,7 @@ void FakeKtraceService::ktrace_session_destroy(const Session& /*session*/) {
 std::uint64_t FakeKtraceService::ktrace_convert_timestamp_to_nanoseconds(
     const Session& /*session*/, std::uint64_t timestamp) const {
   const std::lock_guard lock(mutex_);
-  return timestamp * nanosecondsPerTick_;
+  return kNanosecondsAtTickZero + timestamp * timebaseNanoseconds_ / timebaseTicks_;
 }
 
 }  // namespace halvox::platform

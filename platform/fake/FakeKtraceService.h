@@ -10,7 +10,9 @@
 
 namespace halvox::platform {
 
-// Kernel traces whose events a test makes up. A tick is as many nanoseconds as the test says. The
+// Kernel traces whose events a test makes up. Its clock is like that of a machine: it did not begin
+// at tick 0, and a tick need not be a whole number of nanoseconds, so that the nanoseconds of a
+// difference are not the difference of the nanoseconds. At first a tick is one nanosecond. The
 // events of a session are delivered, and its completion called, on its queue when it is ended.
 // Notes each operation in the journal. Any thread may call.
 class FakeKtraceService final : public KtraceService {
@@ -20,7 +22,9 @@ class FakeKtraceService final : public KtraceService {
 
   // The events that each session will deliver, as far as its range goes.
   void setEvents(std::vector<trace_point> events);
-  void setNanosecondsPerTick(std::uint64_t nanoseconds);
+  void setNanosecondsPerTick(std::uint64_t nanoseconds) { setTimebase(nanoseconds, 1); }
+  // So many ticks take so many nanoseconds; what is left of a nanosecond is cut off.
+  void setTimebase(std::uint64_t nanoseconds, std::uint64_t ticks);
   void failRange(int error);
   void failStart(int error);
 
@@ -40,7 +44,8 @@ class FakeKtraceService final : public KtraceService {
   Journal& journal_;
   mutable std::mutex mutex_;
   std::vector<trace_point> events_;
-  std::uint64_t nanosecondsPerTick_ = 1;
+  std::uint64_t timebaseNanoseconds_ = 1;
+  std::uint64_t timebaseTicks_ = 1;
   int rangeError_ = 0;
   int startError_ = 0;
 };
