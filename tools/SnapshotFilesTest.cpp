@@ -133,7 +133,7 @@ TEST_F(SnapshotFilesTest, ExtractsAndRefusesToOverwriteUnlessForced) {
   EXPECT_TRUE(fs::exists(directory_ / "to/asound/cards"));
   EXPECT_THAT(out_.str(), HasSubstr("to/manifest.json\n"));
   EXPECT_EQ(extract(file), ExitStatus::kRefused);
-  EXPECT_THAT(errors_.str(), HasSubstr("it is there already"));
+  EXPECT_THAT(errors_.str(), HasSubstr("the file already exists"));
   EXPECT_EQ(extract("newest", true), ExitStatus::kDone);
 }
 

@@ -223,7 +223,7 @@ class Snapshots(unittest.TestCase):
         haptics = HapticsClient(service)
         haptics.send(report(1))
         haptics.send(report(2))
-        wait_for("an error line", lambda: "no snapshot was taken" in service.log())
+        wait_for("an error line", lambda: "cannot take a snapshot" in service.log())
         wait_for("the answer", lambda: answers(service) == 1)
 
         place.unlink()
@@ -272,7 +272,7 @@ class Snapshots(unittest.TestCase):
         self.assertEqual(json.loads((target / "signature.json").read_text())["Domain"], "Acoustat")
         again = self.ctl(service, "snapshots", "extract", "newest", "--to", str(target))
         self.assertEqual(again.returncode, 1)
-        self.assertIn("it is there already", again.stderr)
+        self.assertIn("the file already exists", again.stderr)
 
     def ctl(self, service, *arguments):
         return subprocess.run([CTL, *arguments], capture_output=True, text=True, timeout=harness.DEADLINE,

@@ -25,7 +25,7 @@ Finding readBounded(const std::filesystem::path& file, std::size_t most) {
   Finding finding;
   std::array<char, 16'384> buffer;
   for (;;) {
-    // One byte more than wanted shows that there is more.
+    // Reading one byte more than wanted shows whether the file is longer.
     const std::size_t room = std::min(buffer.size(), most + 1 - finding.bytes.size());
     const ssize_t count = ::read(descriptor.get(), buffer.data(), room);
     if (count < 0 && errno == EINTR) continue;

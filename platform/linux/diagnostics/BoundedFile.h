@@ -6,21 +6,22 @@
 
 namespace halvox::platform::linux_ {
 
-// What was found out about one thing: bytes, or why there are none.
+// The result of collecting one thing: bytes, or the reason why there are none.
 struct Finding {
   std::string bytes{};
-  bool isCut = false;     // the bytes are the start of more
-  std::string failure{};  // empty: the bytes were collected
+  bool isCut = false;     // there was more than `bytes`
+  std::string failure{};  // empty if the bytes were collected
 
   static Finding failed(std::string why) { return {.bytes = {}, .failure = std::move(why)}; }
   [[nodiscard]] bool isCollected() const { return failure.empty(); }
 };
 
-// The first bytes of a file, such as one of the kernel's that has no size. Does not follow a link
-// at the path's end, reads regular files only, and never waits for another process.
+// Reads at most the first `most` bytes of a file. Does not rely on the file's size, which is 0 for
+// files in /proc. Reads only regular files and does not follow a link in the last component. Blocks
+// on the disk, but never waits for another process as reading a pipe would.
 [[nodiscard]] Finding readBounded(const std::filesystem::path& file, std::size_t most);
 
-// The text of an errno.
+// Returns the system's text for an errno.
 [[nodiscard]] std::string errorText(int error);
 
 }  // namespace halvox::platform::linux_

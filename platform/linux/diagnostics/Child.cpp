@@ -37,8 +37,9 @@ class SpawnAttributes {
  public:
   SpawnAttributes() {
     ::posix_spawnattr_init(&attributes_);
-    // Our threads block all signals and the service ignores some; programs expect neither. A group
-    // of its own, so that all of it can be killed.
+    // The service's threads block all signals, and the service ignores some. A program that
+    // inherits this may not end when it should. The process group of its own lets one kill() reach
+    // everything that the program started.
     sigset_t signals;
     ::sigemptyset(&signals);
     ::posix_spawnattr_setsigmask(&attributes_, &signals);
@@ -57,7 +58,7 @@ class SpawnAttributes {
   posix_spawnattr_t attributes_{};
 };
 
-// Texts in the form that the system takes them.
+// Owns texts and their null-terminated array of pointers, as posix_spawn() takes them.
 class TextVector {
  public:
   explicit TextVector(std::vector<std::string> texts) : texts_(std::move(texts)) {
@@ -79,7 +80,7 @@ TextVector passedEnvironment() {
   return TextVector(std::move(texts));
 }
 
-// Zero, or the error.
+// Returns 0 or an errno.
 int spawn(const std::vector<std::string>& command, int output, pid_t& pid) {
   SpawnActions actions;
   SpawnAttributes attributes;
@@ -112,14 +113,15 @@ ReadEnd readOutput(int descriptor, std::size_t most, const Deadline& deadline,
       output.resize(most);
       return ReadEnd::kTooMuch;
     }
-    // A program that never stops printing must not keep us from the deadline.
+    // poll() never times out while a program prints without a pause, so test the time here too.
     if (deadline.hasPassed()) return ReadEnd::kTimeOver;
   }
 }
 
-// Waits for the end of a program that closed its output; false when the time is over.
+// Waits for the end of a program that has closed its output. Returns false at the deadline.
 bool awaitEnd(pid_t pid, const Deadline& deadline, int& status) {
-  // Called by its number: the header of this C library lacks the language linkage for C++.
+  // The number instead of the function: <sys/pidfd.h> of Debian 12's C library declares it without
+  // C linkage for C++.
   const UniqueFd process(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
   std::array<pollfd, 2> polled{
       {{process.get(), POLLIN, 0}, {deadline.stop().descriptor(), POLLIN, 0}}};
@@ -137,8 +139,8 @@ void killAndReap(pid_t pid) {
 }
 
 std::string endText(int status) {
-  if (WIFSIGNALED(status)) return "it was killed by signal " + std::to_string(WTERMSIG(status));
-  return "it ended with status " + std::to_string(WEXITSTATUS(status));
+  if (WIFSIGNALED(status)) return "killed by signal " + std::to_string(WTERMSIG(status));
+  return "ended with status " + std::to_string(WEXITSTATUS(status));
 }
 
 }  // namespace
@@ -167,7 +169,7 @@ Finding runProgram(const std::vector<std::string>& command, std::size_t most,
     finding.isCut = true;
     return finding;
   }
-  return Finding::failed(command.front() + ": it took too long");
+  return Finding::failed(command.front() + ": did not end in time and was killed");
 }
 
 }  // namespace halvox::platform::linux_

@@ -9,11 +9,17 @@
 
 namespace halvox::platform::linux_ {
 
-// Runs a program, without a shell, and collects what it prints on standard output; it gets nothing
-// to read, no open file of ours and only the environment that a sound server's client needs. It is
-// killed, with what it started, at the deadline and when it prints more than `most` bytes, of which
-// the first are kept in the second case alone. A program that is not there, and one that does not
-// end with status 0, are failures.
+// Runs a program and collects its standard output. Blocks until the program has ended, at most
+// until the deadline.
+//
+// There is no shell. The program has an empty standard input, none of this process's descriptors,
+// no blocked or ignored signals, and only the environment variables that a client of a sound
+// server needs.
+//
+// At the deadline the program and the processes that it started are killed; the finding is then a
+// failure. They are also killed when the program prints more than `most` bytes; the finding then
+// has the first `most` bytes and is marked as cut. A program that is not installed, and one that
+// ends with a signal or a status other than 0, are failures.
 [[nodiscard]] Finding runProgram(const std::vector<std::string>& command, std::size_t most,
                                  const Deadline& deadline);
 

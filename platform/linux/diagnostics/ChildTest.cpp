@@ -21,26 +21,26 @@ class ChildTest : public ::testing::Test {
   WaitableFlag stop_;
 };
 
-TEST_F(ChildTest, GivesWhatAProgramPrints) {
+TEST_F(ChildTest, ReturnsWhatAProgramPrints) {
   const Finding finding = run({"echo", "a b", "$HOME; x"});
 
   EXPECT_EQ(finding.bytes, "a b $HOME; x\n");
   EXPECT_TRUE(finding.isCollected());
 }
 
-TEST_F(ChildTest, MissingProgramAndBadEndsAreNamed) {
+TEST_F(ChildTest, MissingProgramAndFailingProgramAreNamed) {
   EXPECT_EQ(run({"no-such-program"}).failure, "no-such-program is not installed");
-  EXPECT_EQ(run({"sh", "-c", "exit 3"}).failure, "sh: it ended with status 3");
-  EXPECT_EQ(run({"sh", "-c", "kill -TERM $$"}).failure, "sh: it was killed by signal 15");
+  EXPECT_EQ(run({"sh", "-c", "exit 3"}).failure, "sh: ended with status 3");
+  EXPECT_EQ(run({"sh", "-c", "kill -TERM $$"}).failure, "sh: killed by signal 15");
 }
 
-TEST_F(ChildTest, KillsWhatTakesTooLongWithItsChildren) {
+TEST_F(ChildTest, KillsASlowProgramWithItsChildren) {
   const auto begun = Deadline::Clock::now();
 
   const Finding finding =
       run({"sh", "-c", "sleep 60 & sleep 60"}, 1000, std::chrono::milliseconds(100));
 
-  EXPECT_EQ(finding.failure, "sh: it took too long");
+  EXPECT_EQ(finding.failure, "sh: did not end in time and was killed");
   EXPECT_LT(Deadline::Clock::now() - begun, std::chrono::seconds(20));
 }
 
@@ -48,7 +48,7 @@ TEST_F(ChildTest, ProgramThatClosesItsOutputAndStaysIsKilled) {
   const Finding finding =
       run({"sh", "-c", "exec >&-; exec sleep 60"}, 1000, std::chrono::milliseconds(100));
 
-  EXPECT_EQ(finding.failure, "sh: it took too long");
+  EXPECT_EQ(finding.failure, "sh: did not end in time and was killed");
 }
 
 TEST_F(ChildTest, EndlessOutputIsCut) {
@@ -61,7 +61,7 @@ TEST_F(ChildTest, EndlessOutputIsCut) {
 TEST_F(ChildTest, RaisedFlagEndsTheProgram) {
   stop_.raise();
 
-  EXPECT_EQ(run({"sleep", "60"}).failure, "sleep: it took too long");
+  EXPECT_EQ(run({"sleep", "60"}).failure, "sleep: did not end in time and was killed");
 }
 
 TEST_F(ChildTest, GetsNeitherOurSignalsNorOurVariables) {
@@ -76,7 +76,7 @@ TEST_F(ChildTest, GetsNeitherOurSignalsNorOurVariables) {
   const std::size_t ignored = status.bytes.find("SigIgn:");
   ASSERT_NE(ignored, std::string::npos);
   EXPECT_THAT(status.bytes, HasSubstr("SigBlk:\t0000000000000000"));
-  // Two signals of the C library's own are always ignored.
+  // Test one signal: two signals of the C library's own are always ignored.
   EXPECT_EQ(std::stoull(status.bytes.substr(ignored + 8), nullptr, 16) & (1U << (SIGPIPE - 1)), 0U);
   EXPECT_THAT(environment.bytes, Not(HasSubstr("HALVOX_SECRET")));
 }

@@ -4,7 +4,7 @@
 #include "platform/linux/diagnostics/ProcessFacts.h"
 #include "platform/linux/diagnostics/SnapshotTestSupport.h"
 
-// What is read of processes and of trees of files.
+// Tests of processFacts() and readTree().
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -90,7 +90,7 @@ TEST_F(FactsTest, TreeKeepsItsBounds) {
   EXPECT_EQ(tree({.bytes = 15}).files.size(), 2U);
 }
 
-TEST_F(FactsTest, PipeInATreeDoesNotHoldUs) {
+TEST_F(FactsTest, PipeInATreeIsSkippedWithoutWaiting) {
   ASSERT_EQ(::mkfifo((root.path() / "pipe").c_str(), 0600), 0);
 
   EXPECT_TRUE(tree().files.empty());

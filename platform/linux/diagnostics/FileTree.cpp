@@ -8,7 +8,8 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// The paths first, so that the order of the directory does not decide what the bounds leave out.
+// Finds and sorts the paths before any file is read. Otherwise the order of the directory, which
+// is arbitrary, would decide which files are beyond the bounds.
 std::vector<fs::path> filesBelow(const fs::path& root, const TreeBounds& bounds,
                                  const Deadline& deadline, Tree& tree) {
   constexpr std::size_t kLooksPerFile = 16;

@@ -10,27 +10,28 @@
 
 namespace halvox::platform::linux_ {
 
-// How much of a tree of files is copied.
+// How much of a directory tree is read.
 struct TreeBounds {
   int depth = 6;
   std::size_t files = 512;
-  std::size_t bytesOfFile = 64U << 10U;
-  std::size_t bytes = 1U << 20U;
+  std::size_t bytesOfFile = 64U << 10U;  // of one file
+  std::size_t bytes = 1U << 20U;         // of all files together
 };
 
 struct TreeFile {
-  std::filesystem::path path;  // below the tree's root
+  std::filesystem::path path;  // relative to the root of the tree
   std::string bytes;
 };
 
 struct Tree {
-  std::vector<TreeFile> files;  // in the order of their paths
-  std::size_t unreadable = 0;   // files that could not be read
-  bool isCut = false;           // there is more than the bounds allow
-  std::string failure;          // why there is no tree at all
+  std::vector<TreeFile> files;  // sorted by path
+  std::size_t unreadable = 0;   // the number of files that could not be read
+  bool isCut = false;           // a bound or the deadline was reached
+  std::string failure;          // why the root could not be read; empty if it was
 };
 
-// The readable regular files below a directory. Links are not followed.
+// Reads the regular files below a directory. Does not follow links. Blocks on the disk; stops at
+// the deadline.
 [[nodiscard]] Tree readTree(const std::filesystem::path& root, const TreeBounds& bounds,
                             const Deadline& deadline);
 

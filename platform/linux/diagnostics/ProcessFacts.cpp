@@ -31,7 +31,7 @@ std::optional<std::int32_t> parseNumber(const std::string& text) {
   return number;
 }
 
-// The entries of a directory whose names are numbers, in order; at most so many.
+// Returns the names in a directory that are numbers, sorted; at most `most`.
 std::vector<std::int32_t> numberedEntries(const fs::path& directory, std::size_t most,
                                           std::error_code& error) {
   std::vector<std::int32_t> numbers;
@@ -52,7 +52,7 @@ std::string commandName(const fs::path& process) {
   return replaceInvalidUtf8(name);
 }
 
-// Takes facts of one process together, and what could not be had.
+// Collects the facts about one process, and the reasons for those that could not be read.
 class Facts {
  public:
   void add(const char* key, Value value) { facts_.set(key, std::move(value)); }
@@ -110,7 +110,8 @@ struct Mapped {
   std::uint64_t mappings = 0;
 };
 
-// "55d0-55d1 r-xp 00000000 08:01 1234   /usr/bin/thing": what is mapped and how much of it.
+// Adds one line of /proc/<pid>/maps, such as
+// "55d0-55d1 r-xp 00000000 08:01 1234   /usr/bin/thing".
 void addMapping(std::string_view line, std::map<std::string, Mapped>& all) {
   const std::size_t dash = line.find('-');
   const std::size_t blank = line.find(' ');

@@ -8,13 +8,15 @@
 
 namespace halvox::platform::linux_ {
 
-// What the kernel tells of the processes of that command name (of which it keeps 15 bytes), as far
-// as we may read it: status, command line, limits, control group, a summary of the mappings, the
-// number of open files, the threads. Never the environment, nor what is in any file or in memory.
-// What could not be read is named with the reason.
+// Collects what the kernel knows about the processes with command name `name` (at most 15 bytes,
+// as the kernel keeps it): status, command line, limits, control group, a summary of the memory
+// mappings, the number of open files, and the threads. Never reads the environment, the content of
+// open files or memory: these may hold a user's secrets. Facts that cannot be read are listed under
+// "not_readable" with the reason. Blocks on the disk at most; stops at the deadline.
 //
-// {"name": …, "found": how many, "processes": [{"pid": …, "status": …, …}]}; a few processes at
-// most, those that started first.
+//   {"name": …, "found": <number>, "processes": [{"pid": …, "status": …, …}]}
+//
+// Describes at most 8 processes, those with the lowest numbers; "found" counts all.
 [[nodiscard]] Dictionary processFacts(const std::filesystem::path& procRoot, std::string_view name,
                                       const Deadline& deadline);
 

@@ -1,7 +1,7 @@
 #pragma once
 
-// The keys of a signature, as its archive and the store show it. "TriggerThresholdValues" is there
-// only when values were given.
+// The keys of a signature in archives and in the store. "TriggerThresholdValues" is present only
+// when the request had such values.
 namespace halvox::platform::linux_::signature_key {
 
 inline constexpr const char* kDomain = "Domain";

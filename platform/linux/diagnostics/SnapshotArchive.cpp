@@ -22,8 +22,9 @@ constexpr mode_t kMode = 0600;
 
 }  // namespace
 
-// The library loses memory when writing fails, so to it writing never does: after an error its
-// bytes are discarded, and the error is looked at after each step.
+// libarchive leaks memory once its output has failed. The write callback therefore never fails: it
+// remembers the first error and discards later bytes. SnapshotArchive tests the error after each
+// step.
 struct SnapshotArchive::Writer {
   UniqueFd file;
   int error = 0;  // the first one
@@ -52,7 +53,7 @@ SnapshotArchive::SnapshotArchive(std::filesystem::path temporaryPath, std::uint6
     : path_(std::move(temporaryPath)), writer_(std::make_unique<Writer>()), room_(mostBytes) {}
 
 SnapshotArchive::~SnapshotArchive() {
-  // Freeing an archive that is not finished writes its rest.
+  // Freeing an unfinished archive writes its remaining bytes. Discard them.
   writer_->isDiscarding = true;
   writer_->handle.reset();
   if (isCreated_ && !isKept_) ::unlink(path_.c_str());
@@ -113,9 +114,9 @@ SnapshotArchive::Failure SnapshotArchive::failed() const {
   if (Failure failure = writeFailure()) return failure;
   const int error = archive_errno(writer_->handle.get());
   const char* text = archive_error_string(writer_->handle.get());
-  // The library's own numbers, which are no errno, are negative.
+  // A positive number is an errno; libarchive's own codes are negative.
   if (error > 0) return path_.native() + ": " + errorText(error);
-  return path_.native() + ": " + (text == nullptr ? "the archive cannot be written" : text);
+  return path_.native() + ": " + (text == nullptr ? "cannot write the archive" : text);
 }
 
 }  // namespace halvox::platform::linux_

@@ -9,14 +9,17 @@
 
 namespace halvox::platform::linux_ {
 
-// One tar archive (pax, compressed by zstd) on its way to the disk under a temporary name, mode
-// 0600. Let go of before it was kept, it leaves no file behind. Belongs to one thread; everything
-// waits for the disk. Failures are texts that name the file and the reason.
+// Writes one tar archive (pax format, zstd compression, mode 0600) under a temporary name. The
+// destructor deletes the file unless keep() was called. Belongs to one thread and one owner. All
+// functions but the getters block on the disk. A Failure is a text that names the file and the
+// reason; after one, only destruction makes sense.
+//
+//   open(); add() for each file; finish(); rename the file; keep()
 class SnapshotArchive {
  public:
   using Failure = std::optional<std::string>;
 
-  // Holds at most that many bytes of content before compression.
+  // `mostBytes` bounds the content before compression.
   SnapshotArchive(std::filesystem::path temporaryPath, std::uint64_t mostBytes);
   SnapshotArchive(const SnapshotArchive&) = delete;
   SnapshotArchive& operator=(const SnapshotArchive&) = delete;
@@ -24,23 +27,23 @@ class SnapshotArchive {
 
   [[nodiscard]] Failure open();
   [[nodiscard]] std::uint64_t roomLeft() const { return room_; }
-  // Adds a file. There must be room for it.
+  // Adds a file. The caller must have checked roomLeft().
   [[nodiscard]] Failure add(const std::string& name, std::string_view bytes);
-  // Ends the archive and brings it to the disk.
+  // Completes the archive and syncs it to the disk.
   [[nodiscard]] Failure finish();
-  // The archive has got another name and stays.
+  // Keeps the file. Call it after the file was renamed.
   void keep() { isKept_ = true; }
 
   [[nodiscard]] const std::filesystem::path& temporaryPath() const { return path_; }
-  // Of the file on the disk, once it is finished.
+  // The size of the file in bytes, after finish().
   [[nodiscard]] std::uint64_t size() const { return size_; }
 
  private:
   struct Writer;
 
-  // Why bytes did not reach the disk; none when they did.
+  // Returns why a write to the file failed, or std::nullopt if all succeeded.
   [[nodiscard]] Failure writeFailure() const;
-  // Why the library did not take what it was given.
+  // Returns why a call of libarchive failed.
   [[nodiscard]] Failure failed() const;
 
   const std::filesystem::path path_;

@@ -16,21 +16,22 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::size_t kBytesOfDump = 16U << 20U;
-// For the manifest, whatever the parts take.
+// Reserved for the manifest, however large the other parts are.
 constexpr std::uint64_t kRoomForManifest = 1U << 20U;
 
 double secondsOf(Deadline::Clock::duration time) {
   return std::chrono::duration<double>(time).count();
 }
 
-// What a state source gives, perhaps long after nobody waits for it any more.
+// The answer of a state source. Shared with the source, which may answer after the wait has timed
+// out.
 struct StateAnswer {
   WaitableFlag hasCome;
   Mutex mutex;
   Dictionary state HALVOX_GUARDED_BY(mutex);
 };
 
-// False when the deadline passed first.
+// Waits for the flag. Returns false if the deadline passed first.
 bool awaitFlag(const WaitableFlag& flag, const Deadline& deadline) {
   while (!flag.isRaised() && !deadline.hasPassed()) {
     std::array<pollfd, 2> polled{
@@ -48,7 +49,8 @@ SnapshotCollector::SnapshotCollector(const SnapshotRequest& request, const Snaps
                                      SnapshotArchive& archive, const Deadline& deadline)
     : request_(request), sources_(sources), archive_(archive), deadline_(deadline) {}
 
-// What changes quickly comes first, and what may take long last.
+// Parts that change quickly come first: they must show the moment of the request. Parts that may
+// take long come last: they can use up the time without costing another part.
 std::optional<std::string> SnapshotCollector::collect() {
   addSignature();
   addRequest();
@@ -65,8 +67,8 @@ void SnapshotCollector::addSignature() {
   addPart("signature.json", [this] { return Finding{.bytes = json(request_.signature)}; });
 }
 
-// Only when there is more to a request than its signature. The duration is noted and no more: what
-// is captured is the moment.
+// Omitted when a request has nothing but its signature. The duration is only noted, because a
+// snapshot shows one moment.
 void SnapshotCollector::addRequest() {
   if (!request_.event && !request_.payload && request_.durationSeconds == 0) return;
   addPart("request.json", [this] {
@@ -82,7 +84,7 @@ void SnapshotCollector::addState() {
 }
 
 Finding SnapshotCollector::findState() {
-  if (!sources_.state) return Finding::failed("nobody knows the service's state");
+  if (!sources_.state) return Finding::failed("no source of the service's state was set");
   const auto answer = std::make_shared<StateAnswer>();
   sources_.state([answer](const Dictionary& state) {
     {
@@ -104,7 +106,7 @@ Finding SnapshotCollector::findState() {
 
 void SnapshotCollector::addLog() {
   addPart("log.txt", [this] {
-    if (!sources_.log) return Finding::failed("no lines are kept in memory");
+    if (!sources_.log) return Finding::failed("the service keeps no log lines in memory");
     LogMemory::Contents contents = sources_.log();
     return Finding{.bytes = std::move(contents.text), .isCut = contents.lines < contents.added};
   });
@@ -117,10 +119,12 @@ void SnapshotCollector::addProcess() {
 Finding SnapshotCollector::findProcess() {
   const Value* name = request_.signature.find(signature_key::kDetectedProcess);
   if (name == nullptr || name->string().empty()) {
-    return Finding::failed("the signature names no process");
+    return Finding::failed("the signature does not name a process");
   }
   const Dictionary facts = processFacts(sources_.paths.proc, name->string(), deadline_);
-  if (facts.find("found")->toUInt64() == 0) return Finding::failed("no such process runs");
+  if (facts.find("found")->toUInt64() == 0) {
+    return Finding::failed("no process of that name is running");
+  }
   return {.bytes = json(facts)};
 }
 
@@ -141,7 +145,7 @@ void SnapshotCollector::addSound() {
     failure_ = archive_.add("asound/" + file.path.generic_string(), file.bytes);
     asound.bytes += file.bytes;
   }
-  if (asound.failure.empty() && tree.files.empty()) asound.failure = "there is nothing in it";
+  if (asound.failure.empty() && tree.files.empty()) asound.failure = "the directory has no files";
   note("asound/", asound, Clock::now() - begun);
   addPart("pw-dump.json", [this] {
     return runProgram(sources_.paths.pipeWireDump, kBytesOfDump,
@@ -160,13 +164,13 @@ void SnapshotCollector::addManifest() {
 void SnapshotCollector::addPart(const char* name, const std::function<Finding()>& find) {
   if (isOver()) return;
   const Clock::time_point begun = Clock::now();
-  Finding finding = deadline_.hasPassed() ? Finding::failed("no time was left") : find();
+  Finding finding = deadline_.hasPassed() ? Finding::failed("the time limit was reached") : find();
   if (deadline_.stop().isRaised()) {
     failure_ = "the service is ending";
     return;
   }
   if (finding.isCollected() && archive_.roomLeft() < finding.bytes.size() + kRoomForManifest) {
-    finding = Finding::failed("no room was left");
+    finding = Finding::failed("the size limit of the archive was reached");
   }
   if (finding.isCollected()) failure_ = archive_.add(name, finding.bytes);
   note(name, finding, Clock::now() - begun);

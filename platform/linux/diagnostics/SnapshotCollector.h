@@ -18,34 +18,36 @@
 
 namespace halvox::platform::linux_ {
 
-// What is to be captured, and for what.
+// What a client of the service asked for. All of it goes into the archive.
 struct SnapshotRequest {
   Date time;
   Dictionary signature;
-  double durationSeconds = 0;
+  double durationSeconds = 0;  // only noted: a snapshot shows one moment
   std::optional<Dictionary> event{};
   std::optional<Dictionary> payload{};
 };
 
-// Where the parts of a snapshot come from.
+// Where the parts of a snapshot come from, and how long two of them may take.
 struct SnapshotSources {
   SystemPaths paths;
-  std::function<LogMemory::Contents()> log{};  // empty: there is none
-  DiagnosticReporterService::StateSource state{};
+  std::function<LogMemory::Contents()> log{};      // empty: no log is kept in memory
+  DiagnosticReporterService::StateSource state{};  // empty: no service has set one
   std::chrono::milliseconds stateWithin{2000};
   std::chrono::milliseconds dumpWithin{3000};
 };
 
-// Puts all parts of one snapshot into an archive, in the end a manifest with each part's size and
-// time or why it is missing. A part that cannot be had, or for which there is no time or room left,
-// is such an entry and no failure. Used once, on one thread.
+// Collects the parts of one snapshot into an archive. The last part is a manifest, which lists each
+// part with its size and the time that it took, or with the reason why it is missing. A part that
+// cannot be collected, or for which no time or room remains, is not a failure of the snapshot.
+// Made for one snapshot, and used by the thread that takes it.
 class SnapshotCollector {
  public:
-  // All must outlive it.
+  // Does not own its arguments, which must outlive it.
   SnapshotCollector(const SnapshotRequest& request, const SnapshotSources& sources,
                     SnapshotArchive& archive, const Deadline& deadline);
 
-  // Why the archive could not be written, or that the service is ending; none when all went well.
+  // Collects all parts; call it once. Blocks until the deadline at most. Returns an error when the
+  // archive cannot be written or the service is ending.
   [[nodiscard]] std::optional<std::string> collect();
 
  private:
@@ -72,7 +74,7 @@ class SnapshotCollector {
   const Deadline& deadline_;
   const Clock::time_point begun_ = Clock::now();
   PayloadEncoder encoder_;
-  std::vector<Value> items_;  // of the manifest
+  std::vector<Value> items_;  // the entries of the manifest
   std::optional<std::string> failure_;
 };
 

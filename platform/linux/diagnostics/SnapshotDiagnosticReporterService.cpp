@@ -24,7 +24,7 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr int kNiceness = 10;
-constexpr const char* kBusy = "another snapshot is in work";
+constexpr const char* kBusy = "another snapshot is being taken";
 constexpr const char* kEnding = "the service is ending";
 
 LogCategory& diagnosticsCategory() {
@@ -34,7 +34,7 @@ LogCategory& diagnosticsCategory() {
 
 constexpr UnitLog kLog(diagnosticsCategory, "SnapshotReporter");
 
-// What became of one request: a file, or why there is none.
+// The result of one request: a file, or the reason why there is none.
 struct Outcome {
   std::filesystem::path path{};
   std::uint64_t size = 0;
@@ -50,7 +50,8 @@ std::string_view textOf(const Dictionary& signature, const char* key) {
 
 }  // namespace
 
-// The thread of snapshots and what it works on. Held by the service and by its reporters.
+// The thread of snapshots and its work. Shared by the service and its reporters, which may outlive
+// the service.
 class SnapshotDiagnosticReporterService::Worker {
  public:
   using Reply = AILDiagnosticReporter::Reply;
@@ -96,7 +97,7 @@ class SnapshotDiagnosticReporterService::Worker {
   Counter& failed_;
   Counter& ending_;
   WaitableFlag stop_;
-  OncePerSecond errorLines_;  // the thread only
+  OncePerSecond errorLines_;  // used by the thread only
   Mutex mutex_;
   Condition wakeUp_;
   StateSource state_ HALVOX_GUARDED_BY(mutex_);
@@ -111,7 +112,7 @@ void SnapshotDiagnosticReporterService::Worker::request(SnapshotRequest request,
   const Taken taken = tryTake(work);
   if (taken == Taken::kTaken) return;
   (taken == Taken::kBusy ? busy_ : ending_).add();
-  // Not from here: a reply comes after this has returned.
+  // Reply from another thread: callers rely on no reply coming before this function has returned.
   dispatch().asyncAfterOnBackgroundQueue(
       std::chrono::nanoseconds(0),
       [reply = std::move(work.reply), why = taken == Taken::kBusy ? kBusy : kEnding] {
@@ -149,7 +150,8 @@ void SnapshotDiagnosticReporterService::Worker::stop() {
 
 void SnapshotDiagnosticReporterService::Worker::run() {
   setUpThread("snapshots");
-  // Captures must not slow down what they are about. Programs that they start inherit it.
+  // A capture must not slow down the audio processes that it examines. The programs that it starts
+  // inherit the priority.
   ::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), kNiceness);
   for (;;) {
     std::optional<Work> work;
@@ -169,7 +171,7 @@ void SnapshotDiagnosticReporterService::Worker::carryOut(const Work& work) {
   const std::chrono::duration<double> took = std::chrono::steady_clock::now() - begun;
   const Dictionary response = conclude(work.request, outcome, took.count());
   {
-    // Before the reply: whoever has it may ask for the next one.
+    // Reset before the reply: its receiver may request the next snapshot at once.
     const MutexLock lock(mutex_);
     isInWork_ = false;
   }
@@ -207,7 +209,7 @@ Dictionary SnapshotDiagnosticReporterService::Worker::conclude(const SnapshotReq
                                                                double seconds) {
   if (!outcome.failure.empty()) {
     (stop_.isRaised() ? ending_ : failed_).add();
-    if (errorLines_.tryPass()) kLog.error("no snapshot was taken: ", outcome.failure);
+    if (errorLines_.tryPass()) kLog.error("cannot take a snapshot: ", outcome.failure);
     return errorReply(outcome.failure);
   }
   directory_.keepNewest(options_.keep, outcome.path);
@@ -219,7 +221,7 @@ Dictionary SnapshotDiagnosticReporterService::Worker::conclude(const SnapshotReq
   return {{"path", outcome.path.native()}, {"size_bytes", outcome.size}, {"seconds", seconds}};
 }
 
-// Asks the worker, which it keeps.
+// Makes signatures, and passes requests to the worker, which it keeps alive.
 class SnapshotDiagnosticReporterService::Reporter final : public AILDiagnosticReporter {
  public:
   explicit Reporter(std::shared_ptr<Worker> worker) : worker_(std::move(worker)) {}

@@ -16,47 +16,50 @@ namespace halvox::platform::linux_ {
 
 struct SnapshotOptions {
   std::filesystem::path storageDirectory;
-  std::uint32_t keep = 20;               // so many of the newest snapshots
-  std::uint64_t mostBytes = 64U << 20U;  // of one, before compression
-  // After that nothing more is collected; what there is is written.
+  std::uint32_t keep = 20;               // the number of newest snapshots to keep
+  std::uint64_t mostBytes = 64U << 20U;  // the size of one, before compression
+  // When this time is over, what was collected is written.
   std::chrono::milliseconds collectWithin{8000};
-  std::chrono::milliseconds stateWithin{2000};
-  std::chrono::milliseconds dumpWithin{3000};
+  std::chrono::milliseconds stateWithin{2000};  // for the service's state
+  std::chrono::milliseconds dumpWithin{3000};   // for the dump of PipeWire
   SystemPaths paths{};
 };
 
-// Who else takes part in a snapshot. All must outlive the service.
+// The objects that a snapshot needs. All must outlive the service.
 struct SnapshotPartners {
   StatisticsService& statistics;
-  std::function<LogMemory::Contents()> log{};  // empty: there are no lines
-  SnapshotRecorder* recorder = nullptr;        // null: nobody keeps records
+  std::function<LogMemory::Contents()> log{};  // empty: no log is kept in memory
+  SnapshotRecorder* recorder = nullptr;        // null: no records are kept
 };
 
 // Captures diagnostics into archives in the directory `snapshots` of the storage directory:
 //
 //   20260301T120000Z-haptics-Session_Generic.tar.zst
 //
-// One snapshot at a time, on a thread of its own with a low priority, which begins with the first
-// request and sleeps between them. A request that comes while one is in work is refused, as are
-// those after stop(). Each is answered with {"path", "size_bytes", "seconds"} or {"error"}.
-// A snapshot that cannot be written leaves no file, one error line in the log (a second at most),
-// and the next is tried afresh.
+// Takes one snapshot at a time, on a thread of its own with low priority. The thread starts with
+// the first request and sleeps between requests. A request that comes while another is being
+// carried out is refused, and so is every request after stop(). Each request is answered with
+// {"path", "size_bytes", "seconds"} or {"error"}, never before the call has returned.
 //
-// Any thread may call. Reporters may outlive the service.
+// When a snapshot fails, no file remains and an error is logged, at most one a second. The next
+// request tries again.
+//
+// Owned by the platform. Any thread may call. Reporters may outlive the service.
 class SnapshotDiagnosticReporterService final : public DiagnosticReporterService {
  public:
   SnapshotDiagnosticReporterService(SnapshotOptions options, SnapshotPartners partners);
   ~SnapshotDiagnosticReporterService() override;
 
   [[nodiscard]] std::shared_ptr<AILDiagnosticReporter> createReporter() override;
-  // The source is asked on the thread of snapshots, until stop().
+  // Calls the source on the thread of snapshots, for each snapshot until stop().
   void setStateSource(StateSource source) override;
 
-  // Removes what a service that was killed left in work. Once, while nobody else uses the storage
-  // directory.
+  // Deletes the unfinished snapshot of a service that was killed. Call it before the first request,
+  // after the lock on the storage directory was taken.
   void removeLeftovers() const;
-  // Breaks off the snapshot in work, which leaves nothing, and ends the thread. May be called
-  // again. Not from a reply.
+  // Aborts the current snapshot, which is answered with an error and leaves no file, and ends the
+  // thread. Blocks until then. Idempotent. Must not be called from a reply: the thread would wait
+  // for itself.
   void stop();
 
  private:

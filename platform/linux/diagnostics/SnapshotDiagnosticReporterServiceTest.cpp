@@ -27,7 +27,7 @@ class SnapshotServiceTest : public SnapshotTest {
  protected:
   SnapshotServiceTest() { platform.clock.setCurrentDate({kNoon}); }
 
-  // A state source that answers only when it is told to.
+  // A state source that answers only when the test says so.
   void holdState() {
     service->setStateSource([this](const auto& callback) { asked_.set_value(callback); });
   }
@@ -57,7 +57,7 @@ TEST_F(SnapshotServiceTest, SignatureHasItsFieldsAndValuesOnlyWhenThereAreAny) {
   EXPECT_EQ(reporter->makeSignature("a", "b", "c", "d", "e", Dictionary{{"x", 1}}), withValues);
 }
 
-TEST_F(SnapshotServiceTest, ResponseTellsTheFileOfTimeTypeAndSubType) {
+TEST_F(SnapshotServiceTest, ResponseNamesTheFileByTimeTypeAndSubType) {
   start();
 
   const Dictionary response = snapshot();
@@ -80,7 +80,7 @@ TEST_F(SnapshotServiceTest, ArchiveIsForItsOwnerAloneAndNothingElseIsLeft) {
   EXPECT_THAT(names(), SizeIs(1));
 }
 
-TEST_F(SnapshotServiceTest, ArchiveHasWhatWasCollectedAndSaysWhatWasNot) {
+TEST_F(SnapshotServiceTest, ArchiveHasThePartsAndNamesTheMissingOnes) {
   log = [] { return LogMemory::Contents{.text = "a line\n", .lines = 1, .added = 1}; };
   writeText(options.paths.alsa / "cards", "0 [Dummy]\n");
   writeText(options.paths.alsa / "version", "Driver Version k1\n");
@@ -100,9 +100,9 @@ TEST_F(SnapshotServiceTest, ArchiveHasWhatWasCollectedAndSaysWhatWasNot) {
   EXPECT_THAT(files["system.json"],
               AllOf(HasSubstr("Driver Version k1"), HasSubstr("version 1"), HasSubstr("release")));
   EXPECT_THAT(files, Not(Contains(Key("pw-dump.json"))));
-  EXPECT_THAT(files["manifest.json"],
-              AllOf(HasSubstr("/nowhere/pw-dump is not installed"),
-                    HasSubstr("no such process runs"), HasSubstr(R"("name":"log.txt")")));
+  EXPECT_THAT(files["manifest.json"], AllOf(HasSubstr("/nowhere/pw-dump is not installed"),
+                                            HasSubstr("no process of that name is running"),
+                                            HasSubstr(R"("name":"log.txt")")));
 }
 
 TEST_F(SnapshotServiceTest, EventAndPayloadOfTheRequestAreInTheArchive) {
@@ -119,7 +119,7 @@ TEST_F(SnapshotServiceTest, EventAndPayloadOfTheRequestAreInTheArchive) {
             "{\"duration_seconds\":1.5,\"event\":{\"e\":1},\"payload\":{\"p\":2}}\n");
 }
 
-TEST_F(SnapshotServiceTest, RequestWhileOneIsInWorkIsRefusedAtOnceAndCounted) {
+TEST_F(SnapshotServiceTest, RequestDuringAnotherIsRefusedAtOnceAndCounted) {
   start();
   holdState();
   auto first = request();
@@ -129,7 +129,7 @@ TEST_F(SnapshotServiceTest, RequestWhileOneIsInWorkIsRefusedAtOnceAndCounted) {
   EXPECT_NE(second.wait_for(std::chrono::seconds(0)), std::future_status::ready);
   platform.dispatch.advance(std::chrono::nanoseconds(0));
 
-  EXPECT_EQ(textOf(responseOf(std::move(second)), "error"), "another snapshot is in work");
+  EXPECT_EQ(textOf(responseOf(std::move(second)), "error"), "another snapshot is being taken");
   EXPECT_EQ(counted("dropped: another in work"), 1U);
   answer({});
   EXPECT_FALSE(responseOf(std::move(first)).contains("error"));
@@ -162,7 +162,7 @@ TEST_F(SnapshotServiceTest, OnlyTheNewestAreKept) {
   EXPECT_THAT(names(), ElementsAre(all[2], all[3], all[4]));
 }
 
-TEST_F(SnapshotServiceTest, StateThatDoesNotComeCostsABoundedTimeAndIsNamed) {
+TEST_F(SnapshotServiceTest, MissingStateCostsABoundedTimeAndIsNamed) {
   options.stateWithin = std::chrono::milliseconds(50);
   start();
   service->setStateSource([](const auto&) {});
@@ -182,18 +182,18 @@ TEST_F(SnapshotServiceTest, SlowProgramsCostABoundedTime) {
   auto files = archiveFiles(textOf(snapshot(), "path"));
 
   EXPECT_LT(std::chrono::steady_clock::now() - begun, std::chrono::seconds(10));
-  EXPECT_THAT(files["manifest.json"], HasSubstr("sleep: it took too long"));
+  EXPECT_THAT(files["manifest.json"], HasSubstr("sleep: did not end in time"));
 }
 
-TEST_F(SnapshotServiceTest, WhatFindsNoRoomIsLeftOut) {
-  options.mostBytes = (1U << 20U) + 4000;  // a part of it is kept for the manifest
+TEST_F(SnapshotServiceTest, PartsBeyondTheSizeLimitAreOmitted) {
+  options.mostBytes = (1U << 20U) + 4000;  // of which 1 MiB is reserved for the manifest
   log = [] { return LogMemory::Contents{.text = std::string(5000, 'x'), .lines = 1, .added = 1}; };
   start();
 
   auto files = archiveFiles(textOf(snapshot(), "path"));
 
   EXPECT_THAT(files, Not(Contains(Key("log.txt"))));
-  EXPECT_THAT(files["manifest.json"], HasSubstr("no room was left"));
+  EXPECT_THAT(files["manifest.json"], HasSubstr("the size limit of the archive was reached"));
 }
 
 TEST_F(SnapshotServiceTest, EachSnapshotIsRecordedOnce) {
@@ -217,7 +217,7 @@ TEST_F(SnapshotServiceTest, EachSnapshotIsRecordedOnce) {
   EXPECT_EQ(counted("delivered"), 1U);
 }
 
-TEST_F(SnapshotServiceTest, StopInTheMiddleAnswersAndLeavesNothingBehind) {
+TEST_F(SnapshotServiceTest, StopDuringASnapshotAnswersAndLeavesNoFile) {
   options.stateWithin = std::chrono::seconds(60);
   options.collectWithin = std::chrono::seconds(60);
   start();
@@ -231,7 +231,7 @@ TEST_F(SnapshotServiceTest, StopInTheMiddleAnswersAndLeavesNothingBehind) {
   EXPECT_LT(std::chrono::steady_clock::now() - begun, std::chrono::seconds(5));
   EXPECT_EQ(textOf(responseOf(std::move(response)), "error"), "the service is ending");
   EXPECT_THAT(names(), IsEmpty());
-  answer({});  // comes too late, which harms nobody
+  answer({});  // must do no harm, although it is late
   expectBalance();
 }
 
@@ -262,7 +262,7 @@ TEST_F(SnapshotServiceTest, RequestAfterTheStopIsRefused) {
   expectBalance();
 }
 
-TEST_F(SnapshotServiceTest, ManyThreadsAskAndEachIsAnswered) {
+TEST_F(SnapshotServiceTest, RequestsOfManyThreadsAreAllAnswered) {
   start();
   std::vector<std::future<Dictionary>> responses(40);
   std::vector<std::thread> threads;

@@ -40,7 +40,7 @@ std::string stampOf(Date time) {
   std::array<char, 32> text{};
   if (::gmtime_r(&seconds, &fields) == nullptr ||
       std::strftime(text.data(), text.size(), "%Y%m%dT%H%M%SZ", &fields) == 0) {
-    return "00000000T000000Z";  // a clock that is out of its mind
+    return "00000000T000000Z";  // the clock's date has no calendar form
   }
   return text.data();
 }
@@ -54,11 +54,11 @@ bool isSnapshotName(std::string_view name) {
   return true;
 }
 
-// Zero, or the error; a file that has the name already stays.
+// Renames a file without replacing another. Returns 0 or an errno.
 int renameToFree(const fs::path& from, const fs::path& to) {
   if (::renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0) return 0;
   if (errno != EINVAL && errno != ENOSYS) return errno;
-  // A file system that cannot: nobody but us writes here.
+  // This file system cannot rename so. Testing first is safe enough: no other program writes here.
   if (::access(to.c_str(), F_OK) == 0) return EEXIST;
   return ::rename(from.c_str(), to.c_str()) == 0 ? 0 : errno;
 }
@@ -68,7 +68,7 @@ void syncDirectory(const fs::path& directory) {
   if (descriptor) ::fsync(descriptor.get());
 }
 
-// 1 for "stamp-rest", n for "stamp-n-rest".
+// Returns n for a name "stamp-n-rest", and 1 for "stamp-rest".
 int numberOf(std::string_view name) {
   const std::string_view rest = name.substr(kStampShape.size());
   int number = 1;
@@ -79,7 +79,7 @@ int numberOf(std::string_view name) {
 
 struct Named {
   std::string stamp;
-  std::int64_t modified = 0;  // nanoseconds; orders those of one second
+  std::int64_t modified = 0;  // nanoseconds; orders snapshots of the same second
   fs::path path;
 };
 
@@ -110,8 +110,8 @@ std::variant<fs::path, SnapshotDirectory::Failure> SnapshotDirectory::publish(
     Date time, std::string_view type, std::string_view subType) const {
   const std::string stamp = stampOf(time);
   const std::string rest = "-" + namePart(type) + "-" + namePart(subType) + std::string(kSuffix);
-  // Behind all that are there: a name that has become free is not used again, since records may
-  // still name it.
+  // Number snapshots of the same second upwards. The name of a deleted snapshot must not be used
+  // again: the store's records may still refer to it.
   int first = 1;
   for (const fs::path& path : newestFirst()) {
     const std::string name = path.filename().string();

@@ -12,9 +12,9 @@
 
 namespace halvox::platform::linux_ {
 
-// The directory of snapshots: their names, which of them are kept, and what a service that was
-// killed left there. Nothing is remembered between calls, so the directory may be deleted and come
-// back at any time. Everything waits for the disk.
+// The directory that holds the snapshots: names them, deletes old ones, and removes what a killed
+// service left behind. Remembers nothing between calls, so that the directory may be deleted at any
+// time; any thread may call. All functions but path() and temporaryPath() block on the disk.
 class SnapshotDirectory {
  public:
   struct Failure {
@@ -25,28 +25,30 @@ class SnapshotDirectory {
       : path_(storageDirectory / "snapshots") {}
 
   [[nodiscard]] const std::filesystem::path& path() const { return path_; }
-  // Where a snapshot is while it is in work; there is one at a time.
+  // The path of a snapshot while it is being written. There is only one at a time.
   [[nodiscard]] std::filesystem::path temporaryPath() const;
-  // Makes the directory, not its parents. None when it is there.
+  // Creates the directory unless it exists, but not its parents.
   [[nodiscard]] std::optional<Failure> prepare() const;
-  // Gives the file at temporaryPath() its name for good, which no file has had: "stem.tar.zst", or
-  // with a number in it.
+  // Renames the file at temporaryPath() to its final name and returns the new path:
+  // "<UTC time>-<type>-<sub-type>.tar.zst", with a number after the time if the second already has
+  // snapshots. Never replaces a file.
   [[nodiscard]] std::variant<std::filesystem::path, Failure> publish(
       Date time, std::string_view type, std::string_view subType) const;
-  // Deletes all snapshots but the newest; never the one just written, though a clock that was set
-  // back may have made it look old. Files of other names are left alone.
+  // Deletes all snapshots except the newest `count`. Never deletes `justWritten`, which looks old
+  // after the clock was set back. Files with other names are not touched.
   void keepNewest(std::size_t count, const std::filesystem::path& justWritten) const;
-  // Deletes what was in work when a service ended.
+  // Deletes the unfinished snapshot of a service that was killed.
   void removeLeftovers() const;
-  // The snapshots, newest first.
+  // Returns the paths of the snapshots, newest first.
   [[nodiscard]] std::vector<std::filesystem::path> newestFirst() const;
 
  private:
   std::filesystem::path path_;
 };
 
-// A text as a part of a file's name: letters, digits, '_', '-' and '.' stay, all else becomes '_';
-// never empty, hidden or very long.
+// Makes a text safe as part of a file name. Keeps letters, digits, '_', '-' and '.', and replaces
+// every other byte by '_'. The result is not empty, has at most 64 bytes and does not begin with a
+// dot.
 [[nodiscard]] std::string namePart(std::string_view text);
 
 }  // namespace halvox::platform::linux_

@@ -34,7 +34,7 @@ TEST_F(SnapshotDirectoryTest, SnapshotsOfOneSecondGetNumbersAndNoneIsReplaced) {
   EXPECT_EQ(publish(0), "19700101T000000Z-3-haptics-Generic.tar.zst");
 }
 
-TEST_F(SnapshotDirectoryTest, NameThatHasBecomeFreeIsNotUsedAgain) {
+TEST_F(SnapshotDirectoryTest, NameOfADeletedSnapshotIsNotUsedAgain) {
   publish(0);
   publish(0);
   directory.keepNewest(1, directory.path() / "19700101T000000Z-2-haptics-Generic.tar.zst");
@@ -59,7 +59,7 @@ TEST_F(SnapshotDirectoryTest, NewestComesFirstAndOtherFilesAreNoSnapshots) {
   EXPECT_THAT(newestFirst(), ElementsAre(newest, middle, old));
 }
 
-TEST_F(SnapshotDirectoryTest, JustWrittenOneStaysThoughItsClockWasSetBack) {
+TEST_F(SnapshotDirectoryTest, JustWrittenSnapshotStaysAfterTheClockWasSetBack) {
   const std::string newest = publish(3000);
   publish(2000);
   const std::string justWritten = publish(1000);

@@ -4,7 +4,7 @@
 #include "platform/linux/diagnostics/SnapshotTestSupport.h"
 #include "platform/linux/testing/FileSizeLimit.h"
 
-// How snapshots bear a disk that does not take them.
+// What happens to snapshots when the disk refuses them.
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -17,7 +17,7 @@ using ::testing::SizeIs;
 class SnapshotFailureTest : public SnapshotTest {
  protected:
   SnapshotFailureTest() {
-    // Text that does not compress, so that the disk is needed.
+    // Text that does not compress, so that the archive needs the disk.
     std::string noise;
     std::uint32_t state = 1;
     for (int count = 0; count < 600'000; ++count) {
@@ -33,7 +33,8 @@ class SnapshotFailureTest : public SnapshotTest {
 
     EXPECT_THAT(textOf(response, "error"), HasSubstr(why));
     EXPECT_FALSE(response.contains("path"));
-    EXPECT_THAT(platform.log.texts(LogLevel::kError), Contains(HasSubstr("no snapshot was taken")));
+    EXPECT_THAT(platform.log.texts(LogLevel::kError),
+                Contains(HasSubstr("cannot take a snapshot")));
     expectBalance();
   }
   void expectSuccess() {
@@ -82,7 +83,7 @@ TEST_F(SnapshotFailureTest, FullDiskLeavesNothingAndTheNextWorks) {
   expectSuccess();
 }
 
-TEST_F(SnapshotFailureTest, SomethingElseInTheDirectorysPlaceIsAnErrorUntilItIsGone) {
+TEST_F(SnapshotFailureTest, FileInPlaceOfTheDirectoryIsAnErrorUntilItIsRemoved) {
   writeText(directory(), "in the way");
   expectFailure("Not a directory");
   std::filesystem::remove(directory());

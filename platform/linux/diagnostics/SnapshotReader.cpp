@@ -25,11 +25,13 @@ using DiskWriter = UniqueHandle<archive*, archive_write_free>;
 using Failure = std::optional<SnapshotReadError>;
 
 constexpr std::size_t kBlock = 64U << 10U;
-// More than any of ours has.
+// Above what this program writes, which is 64 MiB before compression by default.
 constexpr std::uint64_t kMostBytes = 256U << 20U;
 constexpr std::size_t kMostEntries = 10'000;
 constexpr std::size_t kMostBytesOfText = 16U << 20U;
-// What the library says instead of an error of the system when a file has another format.
+constexpr const char* kTooLarge = "the archive is too large when unpacked";
+// libarchive's code for a file of another format. Its system text ("Invalid or incomplete multibyte
+// or wide character") would mislead.
 constexpr int kUnknownFormat = EILSEQ;
 
 SnapshotReadError failed(const fs::path& snapshot, const std::string& why) {
@@ -38,20 +40,23 @@ SnapshotReadError failed(const fs::path& snapshot, const std::string& why) {
 
 std::string textOf(archive* handle) {
   const char* text = archive_error_string(handle);
-  return text == nullptr ? "it cannot be read" : text;
+  return text == nullptr ? "cannot read the archive" : text;
 }
 
-// One way through all entries of an archive.
+// One pass over the entries of an archive. Validates each entry before it is returned.
 class Walk {
  public:
   explicit Walk(const fs::path& snapshot) : snapshot_(snapshot), reader_(archive_read_new()) {}
 
   [[nodiscard]] Failure open() {
-    // A pipe could keep us waiting for ever, and to the library no name is the standard input.
+    // Opening a pipe would block until somebody writes to it, and libarchive takes an empty name
+    // for the standard input.
     struct stat status {};
     if (::stat(snapshot_.c_str(), &status) != 0) return failed(snapshot_, errorText(errno));
     if (!S_ISREG(status.st_mode)) {
-      return failed(snapshot_, S_ISDIR(status.st_mode) ? errorText(EISDIR) : "it is no file");
+      return failed(snapshot_, S_ISDIR(status.st_mode)
+                                   ? errorText(EISDIR)
+                                   : "expected a snapshot, found a special file");
     }
     archive_read_support_format_tar(reader_.get());
     archive_read_support_filter_zstd(reader_.get());
@@ -59,35 +64,37 @@ class Walk {
       return std::nullopt;
     }
     const int error = archive_errno(reader_.get());
-    if (error == kUnknownFormat) return failed(snapshot_, "it is no snapshot");
+    if (error == kUnknownFormat) return failed(snapshot_, "not a snapshot: unknown file format");
     return failed(snapshot_, error > 0 ? errorText(error) : textOf(reader_.get()));
   }
 
-  // The next entry, or null at the end; an error when there is no reading on.
+  // Returns the next entry, null at the end of the archive, or an error.
   [[nodiscard]] std::variant<archive_entry*, SnapshotReadError> next() {
     archive_entry* entry = nullptr;
     const int result = archive_read_next_header(reader_.get(), &entry);
     if (result == ARCHIVE_EOF) return nullptr;
     if (result != ARCHIVE_OK) return failed(snapshot_, textOf(reader_.get()));
-    if (++entries_ > kMostEntries) return failed(snapshot_, "it has too many files");
-    // What is passed over is unpacked too, so the sizes count before anything is.
+    if (++entries_ > kMostEntries) return failed(snapshot_, "the archive has too many files");
+    // Skipping an entry decompresses it. Reject by the sizes in the headers, before that.
     announced_ += std::min(static_cast<std::uint64_t>(archive_entry_size(entry)), kMostBytes + 1);
-    if (announced_ > kMostBytes) return failed(snapshot_, "it is too large when unpacked");
+    if (announced_ > kMostBytes) return failed(snapshot_, kTooLarge);
     const char* name = archive_entry_pathname(entry);
     const auto type = archive_entry_filetype(entry);
     if (name == nullptr || archive_entry_hardlink(entry) != nullptr ||
         (type != AE_IFREG && type != AE_IFDIR) || leadsOut(name)) {
-      return failed(snapshot_, "it is no snapshot: it has something else than plain files in it");
+      return failed(
+          snapshot_,
+          "not a snapshot: expected only plain files and directories with relative names");
     }
     return entry;
   }
 
-  // The next piece of the current entry; empty at its end.
+  // Returns the next piece of the current entry, an empty one at its end, or an error.
   [[nodiscard]] std::variant<std::string_view, SnapshotReadError> nextPiece() {
     const la_ssize_t count = archive_read_data(reader_.get(), buffer_.data(), buffer_.size());
     if (count < 0) return failed(snapshot_, textOf(reader_.get()));
     bytes_ += static_cast<std::uint64_t>(count);
-    if (bytes_ > kMostBytes) return failed(snapshot_, "it is too large when unpacked");
+    if (bytes_ > kMostBytes) return failed(snapshot_, kTooLarge);
     return std::string_view(buffer_.data(), static_cast<std::size_t>(count));
   }
 
@@ -101,11 +108,11 @@ class Walk {
   Reader reader_;
   std::array<char, kBlock> buffer_{};
   std::size_t entries_ = 0;
-  std::uint64_t announced_ = 0;  // by the headers
+  std::uint64_t announced_ = 0;  // the sum of the sizes in the headers
   std::uint64_t bytes_ = 0;
 };
 
-// Gives every piece of the current entry to `take`, which returns an error or none.
+// Calls `take` with every piece of the current entry until it returns an error.
 template <typename Take>
 Failure forEachPiece(Walk& walk, Take take) {
   for (;;) {
@@ -117,7 +124,7 @@ Failure forEachPiece(Walk& walk, Take take) {
   }
 }
 
-// Gives every entry to `take`, which returns an error or none.
+// Calls `take` with every entry until it returns an error.
 template <typename Take>
 Failure forEachEntry(const fs::path& snapshot, Take take) {
   Walk walk(snapshot);
@@ -131,7 +138,7 @@ Failure forEachEntry(const fs::path& snapshot, Take take) {
   }
 }
 
-// The process is in that directory as long as this lives.
+// Changes the working directory of the process for the lifetime of this object.
 class WorkingDirectory {
  public:
   explicit WorkingDirectory(const fs::path& directory)
@@ -156,7 +163,7 @@ Failure check(const fs::path& snapshot, const fs::path& directory, ExistingFiles
     const char* name = archive_entry_pathname(entry);
     if (existing == ExistingFiles::kRefuse && archive_entry_filetype(entry) == AE_IFREG &&
         ::lstat(name, &status) == 0) {
-      return SnapshotReadError{(directory / name).native() + ": it is there already"};
+      return SnapshotReadError{(directory / name).native() + ": the file already exists"};
     }
     return std::nullopt;
   });
@@ -165,7 +172,7 @@ Failure check(const fs::path& snapshot, const fs::path& directory, ExistingFiles
 Failure unpackEntry(archive* disk, Walk& walk, archive_entry* entry, const fs::path& directory) {
   const std::string name = archive_entry_pathname(entry);
   const auto diskError = [&] {
-    // The library's text says what failed, and this why.
+    // libarchive's text says which step failed; the system's text says why.
     const int error = archive_errno(disk);
     return SnapshotReadError{(directory / name).native() + ": " + textOf(disk) +
                              (error > 0 ? ": " + errorText(error) : std::string())};
@@ -182,7 +189,8 @@ Failure unpackEntry(archive* disk, Walk& walk, archive_entry* entry, const fs::p
   return std::nullopt;
 }
 
-// Into a directory that is there.
+// Unpacks into an existing directory. The process changes to it because libarchive, as it is set up
+// here, refuses absolute names.
 std::variant<std::vector<std::string>, SnapshotReadError> unpack(const fs::path& source,
                                                                  const fs::path& directory,
                                                                  ExistingFiles existing) {
@@ -215,7 +223,7 @@ std::variant<std::map<std::string, std::string>, SnapshotReadError> readSnapshot
     return forEachPiece(walk, [&](std::string_view bytes) -> Failure {
       text += bytes;
       if (text.size() <= kMostBytesOfText) return std::nullopt;
-      return failed(snapshot, name + " in it is too large");
+      return failed(snapshot, name + " in the archive is too large to be read");
     });
   });
   if (failure) return std::move(*failure);
@@ -225,7 +233,7 @@ std::variant<std::map<std::string, std::string>, SnapshotReadError> readSnapshot
 std::variant<std::vector<std::string>, SnapshotReadError> extractSnapshot(const fs::path& snapshot,
                                                                           const fs::path& directory,
                                                                           ExistingFiles existing) {
-  // The working directory may be gone.
+  // Fails when the current working directory was deleted.
   std::error_code error;
   const fs::path source = fs::absolute(snapshot, error);
   if (error) return failed(snapshot, error.message());
@@ -233,7 +241,7 @@ std::variant<std::vector<std::string>, SnapshotReadError> extractSnapshot(const 
   const bool isMade = ::mkdir(directory.c_str(), 0700) == 0;
   if (!isMade && errno != EEXIST) return failed(directory, errorText(errno));
   auto unpacked = unpack(source, directory, existing);
-  // Only an empty one goes.
+  // rmdir() removes the directory only while it is empty, so unpacked files stay.
   if (isMade && unpacked.index() != 0) ::rmdir(directory.c_str());
   return unpacked;
 }

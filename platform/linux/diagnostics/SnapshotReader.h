@@ -14,18 +14,26 @@ struct SnapshotReadError {
   std::string description;  // names the file and the reason
 };
 
-// The texts of some files of a snapshot, by name; those that it does not have are left out. A
-// snapshot may come from anywhere: what is larger than any of ours is an error.
+// Returns the contents of the files in `names`, by name. A file that the snapshot lacks is absent
+// from the result. Blocks on the disk.
+//
+// A snapshot may come from an untrusted source. It is an error if it is larger than any that this
+// program writes, or if it holds anything but plain files and directories.
 [[nodiscard]] std::variant<std::map<std::string, std::string>, SnapshotReadError> readSnapshotFiles(
     const std::filesystem::path& snapshot, const std::vector<std::string>& names);
 
 enum class ExistingFiles : std::uint8_t { kRefuse, kReplace };
 
-// Unpacks all files of a snapshot below a directory, which is made when it is missing; gives their
-// names. Anything but plain files and directories, names that lead out of the directory, and links
-// on the way are errors; so is, unless they may be replaced, a file that is there already. When the
-// archive itself shows the error, nothing is unpacked and no directory left behind. Changes the
-// process's working directory while it runs.
+// Unpacks a snapshot below `directory`, creates that directory if needed, and returns the names of
+// the entries. Blocks on the disk.
+//
+// It is an error if the snapshot holds anything but plain files and directories, a name leads out
+// of the directory, a symbolic link is in the way, or a file exists and `existing` is kRefuse.
+// Errors that the archive itself shows are found before anything is unpacked, and no directory is
+// left behind. An error while writing, such as a full disk, leaves the files before it.
+//
+// Changes the working directory of the process while it runs, so no other thread may use relative
+// paths.
 [[nodiscard]] std::variant<std::vector<std::string>, SnapshotReadError> extractSnapshot(
     const std::filesystem::path& snapshot, const std::filesystem::path& directory,
     ExistingFiles existing);

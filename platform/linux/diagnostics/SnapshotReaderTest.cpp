@@ -13,7 +13,7 @@ using ::testing::Pair;
 
 class SnapshotReaderTest : public ::testing::Test {
  protected:
-  // The error of unpacking such an archive, or nothing.
+  // Returns the error of unpacking an archive with these entries; empty if it succeeds.
   std::string unpack(const std::vector<TestEntry>& entries,
                      ExistingFiles existing = ExistingFiles::kRefuse) {
     writeArchive(archive, entries);
@@ -34,7 +34,7 @@ TEST_F(SnapshotReaderTest, UnpacksWhatWasPacked) {
   EXPECT_EQ(readText(target / "asound/card0/id"), "Dummy");
 }
 
-TEST_F(SnapshotReaderTest, ReadsTheFilesThatAreAskedForAndThere) {
+TEST_F(SnapshotReaderTest, ReadsTheRequestedFilesThatExist) {
   writeArchive(archive, {{"a", "1"}, {"b", "2"}});
 
   const auto texts = readSnapshotFiles(archive, {"b", "c"});
@@ -46,11 +46,11 @@ TEST_F(SnapshotReaderTest, ReadsTheFilesThatAreAskedForAndThere) {
 TEST_F(SnapshotReaderTest, NamesAndLinksThatLeadOutAreRefused) {
   const std::string absolute = (scratch.path() / "absolute").native();
 
-  EXPECT_THAT(unpack({{"../up", "x"}}), HasSubstr("something else than plain files"));
-  EXPECT_THAT(unpack({{"a/../../up", "x"}}), HasSubstr("something else than plain files"));
-  EXPECT_THAT(unpack({{absolute, "x"}}), HasSubstr("something else than plain files"));
+  EXPECT_THAT(unpack({{"../up", "x"}}), HasSubstr("expected only plain files"));
+  EXPECT_THAT(unpack({{"a/../../up", "x"}}), HasSubstr("expected only plain files"));
+  EXPECT_THAT(unpack({{absolute, "x"}}), HasSubstr("expected only plain files"));
   EXPECT_THAT(unpack({{"link", "", scratch.path().native()}, {"link/up", "x"}}),
-              HasSubstr("something else than plain files"));
+              HasSubstr("expected only plain files"));
   EXPECT_FALSE(std::filesystem::exists(scratch.path() / "up"));
   EXPECT_FALSE(std::filesystem::exists(absolute));
 }
@@ -67,7 +67,7 @@ TEST_F(SnapshotReaderTest, LinksOnTheWayAreNotFollowed) {
 TEST_F(SnapshotReaderTest, ExistingFileIsRefusedBeforeAnythingIsUnpacked) {
   writeText(target / "b", "mine");
 
-  EXPECT_THAT(unpack({{"a", "1"}, {"b", "2"}}), HasSubstr("it is there already"));
+  EXPECT_THAT(unpack({{"a", "1"}, {"b", "2"}}), HasSubstr("the file already exists"));
   EXPECT_EQ(readText(target / "b"), "mine");
   EXPECT_FALSE(std::filesystem::exists(target / "a"));
 
@@ -87,12 +87,12 @@ TEST_F(SnapshotReaderTest, ForcedUnpackingReplacesALinkNotItsTarget) {
 }
 
 TEST_F(SnapshotReaderTest, BrokenAndMissingArchivesAreNamed) {
-  writeText(archive, "this is no archive");
+  writeText(archive, "this is not an archive");
   const auto broken = readSnapshotFiles(archive, {"a"});
   const auto missing = readSnapshotFiles(scratch.path() / "none", {"a"});
 
   ASSERT_EQ(broken.index(), 1U);
-  EXPECT_THAT(std::get<1>(broken).description, HasSubstr("a.tar.zst: it is no snapshot"));
+  EXPECT_THAT(std::get<1>(broken).description, HasSubstr("a.tar.zst: not a snapshot"));
   ASSERT_EQ(missing.index(), 1U);
   EXPECT_THAT(std::get<1>(missing).description, HasSubstr("No such file or directory"));
 }
@@ -113,13 +113,13 @@ TEST_F(SnapshotReaderTest, RefusedArchiveLeavesNoFilesAndNoDirectory) {
   EXPECT_TRUE(std::filesystem::is_empty(target));
 }
 
-TEST_F(SnapshotReaderTest, WhatCannotBeUnpackedIsNamedWithTheReason) {
+TEST_F(SnapshotReaderTest, EntryThatCannotBeUnpackedIsNamedWithTheReason) {
   EXPECT_THAT(unpack({{"a", "1"}, {"a/b", "2"}}), HasSubstr("out/a/b: "));
   EXPECT_THAT(unpack({{"a", "1"}, {"a/b", "2"}}, ExistingFiles::kReplace),
               HasSubstr("Not a directory"));
 }
 
-TEST_F(SnapshotReaderTest, EmptyNameIsAFileThatIsMissing) {
+TEST_F(SnapshotReaderTest, EmptyNameIsAMissingFile) {
   EXPECT_EQ(extractSnapshot("", target, ExistingFiles::kRefuse).index(), 1U);
   const auto read = readSnapshotFiles("", {"a"});
 
@@ -127,7 +127,7 @@ TEST_F(SnapshotReaderTest, EmptyNameIsAFileThatIsMissing) {
   EXPECT_THAT(std::get<1>(read).description, HasSubstr("No such file or directory"));
 }
 
-TEST_F(SnapshotReaderTest, WorkingDirectoryThatIsGoneIsAnError) {
+TEST_F(SnapshotReaderTest, DeletedWorkingDirectoryIsAnError) {
   const std::filesystem::path before = std::filesystem::current_path();
   const std::filesystem::path gone = scratch.path() / "gone";
   std::filesystem::create_directories(gone);
@@ -141,13 +141,14 @@ TEST_F(SnapshotReaderTest, WorkingDirectoryThatIsGoneIsAnError) {
   EXPECT_THAT(std::get<1>(result).description, HasSubstr("a.tar.zst: No such file or directory"));
 }
 
-TEST_F(SnapshotReaderTest, PipeInThePlaceOfAnArchiveKeepsNobodyWaiting) {
+TEST_F(SnapshotReaderTest, PipeInPlaceOfAnArchiveIsRefusedWithoutWaiting) {
   ASSERT_EQ(::mkfifo(archive.c_str(), 0600), 0);
 
   const auto read = readSnapshotFiles(archive, {"a"});
 
   ASSERT_EQ(read.index(), 1U);
-  EXPECT_THAT(std::get<1>(read).description, HasSubstr("it is no file"));
+  EXPECT_THAT(std::get<1>(read).description,
+              HasSubstr("expected a snapshot, found a special file"));
 }
 
 TEST_F(SnapshotReaderTest, TruncatedArchiveIsAnError) {

@@ -6,11 +6,12 @@
 
 namespace halvox::platform::linux_ {
 
-// Keeps a record of each snapshot. Called on the thread that takes snapshots; must not block on
-// more than a lock.
+// Keeps a record of each snapshot that was published. The platform owns it; it outlives the service
+// that takes snapshots. A recorder handles its own failures.
 class SnapshotRecorder {
  public:
   virtual ~SnapshotRecorder() = default;
+  // Called on the thread that takes snapshots. May wait for a lock, but not for I/O.
   virtual void recordSnapshot(Date time, const Dictionary& signature,
                               const std::filesystem::path& path) = 0;
 };

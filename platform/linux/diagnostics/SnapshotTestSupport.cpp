@@ -97,7 +97,7 @@ std::future<Dictionary> SnapshotTest::request(const std::string& process) {
 
 Dictionary SnapshotTest::responseOf(std::future<Dictionary> response) {
   if (response.wait_for(kPatience) != std::future_status::ready) {
-    ADD_FAILURE() << "there is no response";
+    ADD_FAILURE() << "no response came in time";
     return {};
   }
   return response.get();

@@ -21,9 +21,9 @@ namespace halvox::platform::linux_ {
 void writeText(const std::filesystem::path& file, std::string_view text);
 [[nodiscard]] std::string readText(const std::filesystem::path& file);
 
-// What one archive holds, by name, read with nothing of ours.
+// Returns the files of an archive by name, read with libarchive alone.
 [[nodiscard]] std::map<std::string, std::string> archiveFiles(const std::filesystem::path& file);
-// Writes an archive as ours are, with entries that ours never have when the names say so.
+// Writes an archive of the same format. Its entries may be ones that this program never writes.
 struct TestEntry {
   std::string name;
   std::string text{};
@@ -31,7 +31,8 @@ struct TestEntry {
 };
 void writeArchive(const std::filesystem::path& file, const std::vector<TestEntry>& entries);
 
-// A service over fakes, in a scratch directory, with a system of its own to look at.
+// A fixture with a service on fake platform services, in a scratch directory, and with paths of its
+// own in place of /proc and the others.
 class SnapshotTest : public ::testing::Test {
  protected:
   SnapshotTest();
@@ -41,9 +42,9 @@ class SnapshotTest : public ::testing::Test {
         options,
         SnapshotPartners{.statistics = platform.statistics, .log = log, .recorder = recorder});
   }
-  // Asks for a snapshot; the response comes later.
+  // Requests a snapshot and returns the future response.
   [[nodiscard]] std::future<Dictionary> request(const std::string& process = "player");
-  // Asks and waits for the response.
+  // Requests a snapshot and waits for the response.
   [[nodiscard]] Dictionary snapshot(const std::string& process = "player") {
     return responseOf(request(process));
   }
@@ -52,7 +53,7 @@ class SnapshotTest : public ::testing::Test {
   [[nodiscard]] std::filesystem::path directory() const {
     return options.storageDirectory / "snapshots";
   }
-  // The names in the directory of snapshots, sorted.
+  // Returns the names in the directory of snapshots, sorted.
   [[nodiscard]] std::vector<std::string> names() const;
   [[nodiscard]] std::uint64_t counted(std::string_view name) const {
     return platform.statistics.value("diagnostics", name);

@@ -18,7 +18,7 @@ constexpr std::chrono::seconds kVersionWithin{1};
 Dictionary kernel() {
   utsname names{};
   ::uname(&names);
-  // The host's name is left out: it says who somebody is, not what broke.
+  // Omits the host name: it identifies a person and does not explain a fault.
   return {{"name", names.sysname},
           {"release", names.release},
           {"version", names.version},
@@ -31,7 +31,8 @@ std::string trimmed(std::string_view text) {
   return replaceInvalidUtf8(text.substr(begin, text.find_last_not_of(" \t\r\n") - begin + 1));
 }
 
-// KEY="value" lines as entries. Escapes inside of quotes, which hardly occur, stay as they are.
+// Parses lines of the form KEY="value". Leaves escapes within quotes as they are: they hardly occur
+// in os-release.
 Dictionary assignments(std::string_view text) {
   Dictionary entries;
   for (std::size_t begin = 0; begin < text.size();) {
@@ -55,7 +56,7 @@ Dictionary assignments(std::string_view text) {
 Dictionary systemFacts(const SystemPaths& paths, const Deadline& deadline) {
   Dictionary facts{{"kernel", kernel()}};
   Dictionary failures;
-  // The file is a link on most systems.
+  // /etc/os-release is a symbolic link on most systems, and readBounded() does not follow links.
   std::error_code ignored;
   const auto osRelease = std::filesystem::canonical(paths.osRelease, ignored);
   if (const Finding found = readBounded(osRelease, kBytesOfFile); found.isCollected()) {

@@ -9,7 +9,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Where facts about the system are found; a test has its own.
+// Where to find facts about the system. Tests set paths of their own.
 struct SystemPaths {
   std::filesystem::path proc = "/proc";
   std::filesystem::path alsa = "/proc/asound";
@@ -18,8 +18,9 @@ struct SystemPaths {
   std::vector<std::string> pipeWireDump{"pw-dump", "--no-colors"};
 };
 
-// The kernel, the distribution, and the versions of the sound servers: each one's fields or, under
-// "not_readable", why it is missing.
+// Collects the versions of the kernel, the distribution and the sound servers. Those that cannot be
+// found are listed under "not_readable" with the reason. Runs a program, so it blocks for up to one
+// second, or until the deadline if that is earlier.
 [[nodiscard]] Dictionary systemFacts(const SystemPaths& paths, const Deadline& deadline);
 
 }  // namespace halvox::platform::linux_

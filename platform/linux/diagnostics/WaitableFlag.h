@@ -7,17 +7,18 @@
 
 namespace halvox::platform::linux_ {
 
-// Something that happens once, such as that a thread which works for seconds shall leave off: that
-// thread can look, and it can wait for it together with other descriptors. Any thread may raise the
-// flag; it stays raised.
+// A flag that is raised once and stays raised, such as the request to stop. A working thread can
+// test it, and can wait for it together with other descriptors. Any thread may raise or test it.
+// Without a free descriptor it works as a plain flag, and waiting threads notice it when their own
+// wait ends.
 class WaitableFlag {
  public:
   WaitableFlag();
 
+  // Never blocks. What this thread wrote before is visible to threads that see the flag raised.
   void raise();
-  // Acquires what was done before the flag was raised.
   [[nodiscard]] bool isRaised() const { return raised_.load(std::memory_order_acquire); }
-  // Readable once the flag is raised.
+  // Readable (poll) once the flag is raised. Owned by the flag; -1 if there is none.
   [[nodiscard]] int descriptor() const { return event_.get(); }
 
  private:
@@ -25,20 +26,21 @@ class WaitableFlag {
   const UniqueFd event_;
 };
 
-// Until when a capture may go on, and who may end it before.
+// When a capture must end: at a point in time, or earlier when `stop` is raised. A value; copies
+// are independent. Any thread may use it.
 class Deadline {
  public:
   using Clock = std::chrono::steady_clock;
 
-  // `stop` must outlive it.
+  // `stop` must outlive this object and its copies.
   Deadline(const WaitableFlag& stop, Clock::time_point end) : stop_(stop), end_(end) {}
 
-  // The same with an end that is no later than so long from now.
+  // Returns a deadline that ends `time` from now, but not later than this one.
   [[nodiscard]] Deadline within(Clock::duration time) const;
   [[nodiscard]] const WaitableFlag& stop() const { return stop_; }
   [[nodiscard]] Clock::time_point end() const { return end_; }
   [[nodiscard]] bool hasPassed() const { return stop_.isRaised() || Clock::now() >= end_; }
-  // For poll(): 0 when it has passed.
+  // The timeout for poll(), rounded up; 0 when the deadline has passed.
   [[nodiscard]] int millisecondsLeft() const;
 
  private:
