@@ -8,7 +8,8 @@
 
 namespace halvox::platform::linux_ {
 
-// What went wrong with a file or directory, in words: "cannot <what> <path>: <system's error>".
+// Makes the error of an operation on a file or directory, "cannot <what> <path>: <system's text>".
+// `systemError` is an errno and becomes the error's code.
 inline Error fileError(std::string_view what, std::string_view path, int systemError) {
   std::string text = "cannot ";
   text += what;

@@ -1,6 +1,6 @@
 #pragma once
 
-// What the tests of this folder share.
+// Shared by the tests of this folder.
 
 #include <algorithm>
 #include <filesystem>
@@ -17,10 +17,10 @@
 
 namespace halvox::platform::linux_ {
 
-// A service over a root of its own, which is not there yet.
+// A fixture with a service whose root, in a scratch directory, does not exist yet.
 class FilesTest : public testing::Test {
  protected:
-  // The code of the error that the file ends with, 0 when it was written.
+  // Commits the file and returns the code of its error, or 0.
   static std::int64_t codeOf(JsonArrayFile& file) {
     std::string path;
     const auto error = file.commit(path);

@@ -19,7 +19,7 @@ RootedDirectory failed(std::string_view what, const std::string& path, int syste
   return {{}, fileError(what, path, systemError)};
 }
 
-// The names on the way, or none when one of them leads elsewhere.
+// Splits a path into the names below the root. Returns std::nullopt for a path with ".." or NUL.
 std::optional<std::vector<std::string>> namesOf(std::string_view path) {
   std::vector<std::string> names;
   if (path.find('\0') != std::string_view::npos) return std::nullopt;
@@ -30,7 +30,8 @@ std::optional<std::vector<std::string>> namesOf(std::string_view path) {
   return names;
 }
 
-// The system calls a link in the way "not a directory", which would send the reader astray.
+// Replaces the system's error for a symbolic link in the way. With O_NOFOLLOW and O_DIRECTORY it is
+// "not a directory", which does not help somebody who looks for the cause.
 int reasonAt(const UniqueFd& parent, const std::string& name, int systemError) {
   struct stat status {};
   const bool isLink = ::fstatat(parent.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
@@ -40,13 +41,13 @@ int reasonAt(const UniqueFd& parent, const std::string& name, int systemError) {
 
 enum class Missing : std::uint8_t { kIsAnError, kIsMade };
 
-// Goes from `parent` into `name`; sets `made` when it had to make it.
+// Opens `name` in `parent`. Sets `made` if the directory was created.
 RootedDirectory step(const UniqueFd& parent, const std::string& name, const std::string& path,
                      Missing missing, bool& made) {
   made = false;
   if (missing == Missing::kIsMade) {
     made = ::mkdirat(parent.get(), name.c_str(), kParentPermissions) == 0;
-    if (!made && errno != EEXIST) return failed("make directory", path, errno);
+    if (!made && errno != EEXIST) return failed("create directory", path, errno);
   }
   UniqueFd directory(::openat(parent.get(), name.c_str(), kOpenFlags | O_NOFOLLOW));
   if (!directory) return failed("open directory", path, reasonAt(parent, name, errno));
@@ -66,6 +67,7 @@ RootedDirectory walk(const RootedDirectory::Place& place, Missing missing,
     at = step(at.descriptor, name, path, missing, made);
     if (at.error.has_value()) return at;
   }
+  // mkdirat() applies the umask; fchmod() does not.
   if (made && permissions.has_value() && ::fchmod(at.descriptor.get(), *permissions) != 0) {
     return failed("set the permissions of directory", path, errno);
   }
@@ -85,7 +87,7 @@ RootedDirectory RootedDirectory::open(const Place& place) {
 RootedDirectory RootedDirectory::make(const Place& place, std::uint32_t permissions) {
   std::error_code error;
   std::filesystem::create_directories(place.root, error);
-  if (error) return failed("make directory", place.root.string(), error.value());
+  if (error) return failed("create directory", place.root.string(), error.value());
   return walk(place, Missing::kIsMade, permissions);
 }
 

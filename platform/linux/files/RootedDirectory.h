@@ -11,23 +11,26 @@
 
 namespace halvox::platform::linux_ {
 
-// A directory below a root, opened step by step so that no symbolic link below the root is ever
-// followed: nothing can lead out of it, whoever may write there.
+// An open directory below a root. The path is opened one name at a time, without following a
+// symbolic link below the root, and ".." is refused. Nobody who may write below the root can
+// therefore redirect the service to a place outside it. The root itself may be a link.
+//
+// Any thread may call. Blocks on the disk.
 struct RootedDirectory {
-  // What is in the root of the file system for the callers of this.
+  // A path that is absolute to the callers and lies below `root` in the file system.
   struct Place {
     const std::filesystem::path& root;
     std::string_view path;
-    // As it is in the file system.
+    // The path in the file system.
     [[nodiscard]] std::string text() const;
   };
 
   UniqueFd descriptor;
-  std::optional<Error> error;  // why there is no descriptor
+  std::optional<Error> error;  // set when there is no descriptor
 
   [[nodiscard]] static RootedDirectory open(const Place& place);
-  // Makes what is missing: the root and the parents as usual, the last one with exactly these
-  // permissions, whatever the process masks. What exists stays as it is.
+  // Creates the directories that are missing. The last one gets exactly `permissions`, regardless
+  // of the umask. Directories that exist are not changed.
   [[nodiscard]] static RootedDirectory make(const Place& place, std::uint32_t permissions);
 };
 

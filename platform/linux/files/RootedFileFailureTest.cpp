@@ -1,4 +1,4 @@
-// Files and directories that the system does not let be, and what a killed service leaves.
+// What happens when the system refuses a file or a directory, and what a killed service leaves.
 
 #include <cerrno>
 #include <filesystem>
@@ -35,7 +35,7 @@ class RootedFileFailureTest : public FilesTest {
     if (isMounted_) ::umount2((root_ / "a").c_str(), MNT_DETACH);
   }
 
-  // A file system of its own in the place of the directory; false when this process may not.
+  // Mounts a small file system on the directory. Returns false if this process may not mount.
   bool mountSmall(unsigned long flags) {
     isMounted_ = ::mount("halvox-test", (root_ / "a").c_str(), "tmpfs", flags, "size=256k") == 0;
     return isMounted_;
@@ -74,7 +74,7 @@ TEST_F(RootedFileFailureTest, ReadOnlyFileSystemIsAnError) {
   const auto error = service_.createDirectory("/a/b", 0777);
   ASSERT_TRUE(error.has_value());
   EXPECT_EQ(error->description,
-            "cannot make directory " + (root_ / "a/b").string() + ": Read-only file system");
+            "cannot create directory " + (root_ / "a/b").string() + ": Read-only file system");
 }
 
 TEST_F(RootedFileFailureTest, DirectoryThatIsMissingIsAnError) {
@@ -109,7 +109,7 @@ TEST_F(RootedFileFailureTest, DirectoryThatMayNotBeWrittenIsAnError) {
   fs::permissions(scratch_, fs::perms(0755));
   const pid_t child = ::fork();
   if (child == 0) {
-    // Root may write everywhere.
+    // Become another user: root may write everywhere.
     if (::geteuid() == 0 && ::setresuid(kNobody, kNobody, kNobody) != 0) ::_exit(99);
     ::_exit(codeOf(*service_.createJsonArrayFile("/a", "f.json")) == EACCES &&
                     service_.createDirectory("/a/b", 0777)->code == EACCES
@@ -154,7 +154,7 @@ TEST_F(RootedFileFailureTest, FileWithANameOfItsOwnIsFinishedOrLeavesNothing) {
   EXPECT_EQ(textOf(root_ / "a/f.json"), "text");
 }
 
-TEST_F(RootedFileFailureTest, FileInTheMakingIsNoLeftOver) {
+TEST_F(RootedFileFailureTest, FileThatIsBeingWrittenIsNotALeftOver) {
   UnfinishedFile making;
   ASSERT_EQ(making.begin(openDirectory(), UnfinishedFile::Naming::kOwnName), 0);
   const std::string name = namesIn(root_ / "a").front();

@@ -14,7 +14,7 @@ namespace {
 
 constexpr std::size_t kBufferBytes = 64 * 1024;
 
-// The system's error for a name that no file can have, else 0.
+// Returns an errno for a name that a file cannot have, else 0.
 int checkName(std::string_view name) {
   constexpr std::string_view kNotInNames("/\0", 2);
   if (name.empty() || name == "." || name == "..") return EINVAL;
@@ -63,7 +63,7 @@ class RootedJsonArrayFile final : public JsonArrayFile {
     }
   }
 
-  // Writes in pieces of a size that the system likes.
+  // Collects text, so that a write has at least kBufferBytes: an object alone is much shorter.
   void takeText() {
     buffer_ += json_.takeText();
     if (buffer_.size() >= kBufferBytes) flush();
@@ -82,7 +82,8 @@ class RootedJsonArrayFile final : public JsonArrayFile {
     if (const int error = file_.finish(name_)) fail("finish", error);
   }
 
-  // Gives back at once what the file took: a disk may be full.
+  // Frees the disk space of the file at once: the disk may be full, and the caller may keep this
+  // object for long.
   void fail(std::string_view what, int systemError) {
     error_ = fileError(what, path_, systemError);
     file_.discard();

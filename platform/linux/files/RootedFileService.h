@@ -7,14 +7,16 @@
 
 namespace halvox::platform::linux_ {
 
-// Directories and files below a root. No symbolic link below the root is followed, so nothing comes
-// to lie outside it. Files are written without a name and get it when they are on the disk; a name
-// with a slash or NUL, "." and "..", and one that is empty or too long for a file system are
-// errors. Any thread may call; blocks for the disk. Counts the files that were begun, written,
-// failed and let go.
+// Creates directories and files below a root directory. Follows no symbolic link below the root, so
+// nothing is written outside it. A file gets its name only when its content is on the disk.
+//
+// Any thread may call; a file belongs to one thread. Blocks on the disk. Every failure is an Error
+// with the path and the system's text. Invalid file names are errors: those that are empty, ".",
+// "..", too long, or contain a slash or NUL. Counts the files that were begun, written, failed and
+// abandoned.
 class RootedFileService final : public FileService {
  public:
-  // The statistics must outlive the service, the service its files.
+  // Does not own `statistics`, which must outlive the service. The service must outlive its files.
   RootedFileService(std::filesystem::path root, StatisticsService& statistics);
 
   std::optional<Error> createDirectory(std::string_view path, std::uint32_t permissions) override;

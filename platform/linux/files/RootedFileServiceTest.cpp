@@ -85,7 +85,7 @@ TEST_F(RootedFileServiceTest, RootMayBeALink) {
   EXPECT_THAT(namesIn(outside_), ElementsAre("a"));
 }
 
-TEST_F(RootedFileServiceTest, FileAppearsWholeAtTheCommitAndTellsItsPath) {
+TEST_F(RootedFileServiceTest, CommitMakesTheWholeFileAppearAndReturnsItsPath) {
   ASSERT_EQ(service_.createDirectory("/a", 0777), std::nullopt);
   auto file = service_.createJsonArrayFile("/a", "f.json");
   file->appendObject("key", {{"number", 1}});
@@ -99,7 +99,7 @@ TEST_F(RootedFileServiceTest, FileAppearsWholeAtTheCommitAndTellsItsPath) {
   EXPECT_THAT(namesIn(root_ / "a"), ElementsAre("f.json"));
 }
 
-TEST_F(RootedFileServiceTest, FileThatIsLetGoLeavesNothing) {
+TEST_F(RootedFileServiceTest, AbandonedFileLeavesNothing) {
   ASSERT_EQ(service_.createDirectory("/a", 0777), std::nullopt);
 
   for (int number = 0; number < 5; ++number) {
@@ -112,7 +112,7 @@ TEST_F(RootedFileServiceTest, FileThatIsLetGoLeavesNothing) {
   EXPECT_EQ(count("files let go unfinished"), 5U);
 }
 
-TEST_F(RootedFileServiceTest, TakesThePlaceOfAFileOfThatName) {
+TEST_F(RootedFileServiceTest, ReplacesAFileOfThatName) {
   ASSERT_EQ(service_.createDirectory("/a", 0777), std::nullopt);
   for (const int number : {1, 2}) {
     auto file = service_.createJsonArrayFile("/a", "f.json");

@@ -19,11 +19,11 @@ using DirectoryStream = UniqueHandle<DIR*, ::closedir>;
 constexpr mode_t kPermissions = 0644;
 constexpr std::string_view kOwnNameStart = ".halvox-";
 constexpr std::string_view kOwnNameEnd = ".tmp";
-// A younger file may be one whose maker has not locked it yet.
+// A younger file may be one that another process has created but not locked yet.
 constexpr std::chrono::seconds kLeftOverAge{60};
 
 std::string makeOwnName() {
-  static std::atomic<unsigned> made{0};  // orders with nothing: the numbers only have to differ
+  static std::atomic<unsigned> made{0};  // relaxed: the numbers only have to differ
   return std::string(kOwnNameStart) + std::to_string(::getpid()) + "-" +
          std::to_string(made.fetch_add(1, std::memory_order_relaxed)) + std::string(kOwnNameEnd);
 }
@@ -77,7 +77,8 @@ int UnfinishedFile::finish(const std::string& name) {
   if (::fsync(file_.get()) != 0) return errno;
   if (const int error = giveName(name)) return error;
   ownName_.clear();
-  // Some file systems cannot do this to a directory and need no such care.
+  // The name is not on the disk before the directory is. A file system that cannot sync a directory
+  // answers EINVAL; the file is finished all the same.
   if (::fsync(directory_.get()) != 0 && errno != EINVAL) return errno;
   removeLeftOvers();
   discard();
@@ -85,7 +86,8 @@ int UnfinishedFile::finish(const std::string& name) {
 }
 
 int UnfinishedFile::giveName(const std::string& name) {
-  // A file without a name cannot take the place of another; one with a name of its own can.
+  // linkat() cannot replace a file, renameat() can. If the name is taken, link the file under a
+  // temporary name and rename that.
   if (ownName_.empty()) {
     const std::string link = "/proc/self/fd/" + std::to_string(file_.get());
     const auto giveTo = [&](const std::string& to) {
@@ -103,7 +105,7 @@ int UnfinishedFile::giveName(const std::string& name) {
   return done ? 0 : errno;
 }
 
-// Of services that were killed while they wrote.
+// Deletes the temporary files of services that were killed while they wrote.
 void UnfinishedFile::removeLeftOvers() const {
   UniqueFd again(::openat(directory_.get(), ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   const DirectoryStream stream(again ? ::fdopendir(again.get()) : nullptr);

@@ -7,9 +7,14 @@
 
 namespace halvox::platform::linux_ {
 
-// A file that has no name yet and gets it when it is finished. Where the file system has no files
-// without names it bears one of its own, locked so that nobody takes it for a left-over.
-// Belongs to one thread. All results are 0 or the system's error.
+// A file that gets its name only when it is complete, so that readers never see a part of it.
+//
+// Until then it has no name at all (O_TMPFILE), and the kernel removes it when the process dies.
+// On a file system without that feature it has a temporary name, ".halvox-<pid>-<number>.tmp", and
+// a lock. The lock distinguishes it from the files of a killed service, which finish() deletes.
+//
+// Belongs to one thread and one owner. Blocks on the disk. Results are 0 or an errno; after an
+// error only discard() or destruction makes sense.
 class UnfinishedFile {
  public:
   enum class Naming : unsigned char { kNoName, kOwnName };
@@ -17,13 +22,15 @@ class UnfinishedFile {
   UnfinishedFile() = default;
   UnfinishedFile(const UnfinishedFile&) = delete;
   UnfinishedFile& operator=(const UnfinishedFile&) = delete;
-  // Leaves nothing of a file that was not finished.
+  // Discards a file that was not finished.
   ~UnfinishedFile() { discard(); }
 
+  // Creates the file. `naming` is for tests; kOwnName uses a temporary name on every file system.
   [[nodiscard]] int begin(UniqueFd directory, Naming naming = Naming::kNoName);
   [[nodiscard]] int write(std::string_view bytes);
-  // Brings the file to the disk, then gives it the name, in the place of a file that has it.
+  // Syncs the file to the disk, then gives it its name and replaces a file that has it.
   [[nodiscard]] int finish(const std::string& name);
+  // Deletes the file unless it was finished. Idempotent.
   void discard();
 
  private:
@@ -33,7 +40,7 @@ class UnfinishedFile {
 
   UniqueFd directory_;
   UniqueFd file_;
-  std::string ownName_;  // of a file that has one already
+  std::string ownName_;  // the temporary name; empty if there is none
 };
 
 }  // namespace halvox::platform::linux_
