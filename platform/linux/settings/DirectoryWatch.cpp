@@ -9,7 +9,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// A directory that is in its place goes out of it.
+// The watched directory itself is moved or deleted.
 constexpr std::uint32_t kLeaving = IN_MOVE_SELF | IN_DELETE_SELF;
 constexpr std::uint32_t kAppearing = IN_CREATE | IN_MOVED_TO;
 constexpr std::uint32_t kVanishing = IN_MOVED_FROM | IN_DELETE;
@@ -22,7 +22,7 @@ bool isMissing(std::error_code error) {
 
 std::error_code lastError() { return {errno, std::generic_category()}; }
 
-// "/a//b/" is "/a/b".
+// Returns the paths in one form: "/a//b/" becomes "/a/b".
 std::vector<std::filesystem::path> normal(std::vector<std::filesystem::path> paths) {
   for (auto& path : paths) {
     path = path.lexically_normal();
@@ -47,7 +47,8 @@ std::error_code DirectoryWatch::arm(std::vector<std::filesystem::path> directori
   return first;
 }
 
-// Several watches of one directory are one to the kernel, so what is wanted is added up.
+// The kernel has one watch for each directory and returns the same descriptor for all. IN_MASK_ADD
+// adds the events to those of an earlier call; without it they would be replaced.
 std::error_code DirectoryWatch::add(const std::filesystem::path& path, std::uint32_t events,
                                     Watch*& watch) {
   const int descriptor =
@@ -57,8 +58,8 @@ std::error_code DirectoryWatch::add(const std::filesystem::path& path, std::uint
   return {};
 }
 
-// Watches every directory from the root to the one that is wanted, those on the way only for being
-// moved or deleted. Where the way ends, the next name on it is awaited.
+// Watches every directory from the root to the wanted one: the wanted one for changes of its files,
+// the others only for being moved or deleted. Where the path ends, waits for the next name.
 std::error_code DirectoryWatch::watchWay(std::size_t directory) {
   const std::filesystem::path& target = directories_[directory];
   std::filesystem::path path;
@@ -72,11 +73,12 @@ std::error_code DirectoryWatch::watchWay(std::size_t directory) {
       Watch* last = nullptr;
       if (const auto refused = add(parent, kAppearing, last)) return refused;
       last->awaited.insert(part.native());
-      // It may have appeared before it was awaited.
+      // Try again: it may have appeared before the parent was watched.
       error = add(path, isTarget ? kChanging | kLeaving : kLeaving, watch);
       if (isMissing(error)) return {};
     }
-    // One on the way that may be passed but not read is not watched, and taken to stay.
+    // A directory that may be searched but not read cannot be watched. If it is only on the way,
+    // assume that it stays where it is.
     if (error == std::errc::permission_denied && !isTarget) error.clear();
     if (error) return error;
     if (isTarget) {

@@ -15,39 +15,42 @@
 
 namespace halvox::platform::linux_ {
 
-// Hears of what happens to the files of some directories, which need not exist: then it waits for
-// them to appear. Costs nothing while nothing happens.
+// Watches the files in some directories by means of inotify. A directory need not exist: then the
+// watch waits for it to appear. Uses no timer.
 //
 //   made --arm()--> armed --(a directory appeared, vanished or was moved; events were lost)-->
 //   arm()
 //
-// Belongs to one thread.
+// Belongs to one thread and one owner. When a directory cannot be watched, arm() returns the error
+// and the other directories are watched all the same.
 class DirectoryWatch {
  public:
-  // What a change left behind: a file that is there, or none.
+  // Whether the file exists after the change.
   enum class Change : unsigned char { kFileChanged, kFileGone };
-  // The place of the directory among those that are watched, and the name of the file in it.
+  // `directory` is an index into the list that arm() was given; `file` is the name in it.
   using OnChange = std::function<void(std::size_t directory, std::string_view file, Change change)>;
   enum class State : unsigned char { kArmed, kMustBeArmedAgain };
 
-  // Begins anew, with these directories, which are absolute paths. What happened before, also
-  // unnoticed, is for the caller to find out afterwards. Gives the reason when a directory cannot
-  // be watched though it is there.
+  // Starts to watch these directories (absolute paths) instead of those before. Changes between the
+  // last read() and this call are lost: compare the files afterwards. Returns the first error for a
+  // directory that exists but cannot be watched.
   [[nodiscard]] std::error_code arm(std::vector<std::filesystem::path> directories);
-  // Whether that directory was there at the last arm().
+  // Returns true when the directory existed at the last arm().
   [[nodiscard]] bool isThere(std::size_t directory) const { return isThere_[directory]; }
   [[nodiscard]] const std::filesystem::path& path(std::size_t directory) const {
     return directories_[directory];
   }
-  // Readable when something has happened; -1 before the first arm().
+  // Readable (poll) when read() has something to do; -1 before the first arm(). Owned by this
+  // object, and replaced by arm().
   [[nodiscard]] int descriptor() const { return inotify_.get(); }
-  // Tells of each file that was written, touched, created, moved or deleted since the last call.
+  // Calls `onChange` on this thread for each file that was written, touched, created, moved or
+  // deleted since the last call. Does not wait.
   [[nodiscard]] State read(const OnChange& onChange);
 
  private:
   struct Watch {
-    std::vector<std::size_t> directories;        // those that this one is
-    std::set<std::string, std::less<>> awaited;  // names that are missing on the way to one
+    std::vector<std::size_t> directories;        // indices of the directories that this one is
+    std::set<std::string, std::less<>> awaited;  // missing names on the way to a directory
   };
 
   [[nodiscard]] std::error_code watchWay(std::size_t directory);

@@ -24,7 +24,8 @@ using namespace std::chrono_literals;
 
 constexpr UnitLog kLog(settingsCategory, "InotifyNotifyService");
 
-// Changes are posted when it has been quiet for so long, or so long after the first of them.
+// A change is posted after kQuietTime without another, but not later than kLongestDelay after the
+// first: steady changes must not delay a post for ever.
 constexpr auto kQuietTime = 50ms;
 constexpr auto kLongestDelay = 300ms;
 constexpr auto kRetryTime = 5s;
@@ -63,7 +64,8 @@ NotifyStatus InotifyNotifyService::notify_register_dispatch(std::string_view nam
     kLog.error("refused the notification ", shownName(name), ": it cannot be a file's name");
     return kNotifyInvalidName;
   }
-  // Seen before anything can be missed: what changes from here on is found by comparison.
+  // Read the state before the thread adopts the registration. The thread compares with it and so
+  // finds every change from here on, although it does not watch yet.
   SettingBaseline baseline = settings_.look(std::string(name));
   const MutexLock held(mutex_);
   if (isStopping_ || !ensureRunning()) return kNotifyFailed;
@@ -116,7 +118,7 @@ void InotifyNotifyService::run() {
   }
 }
 
-// False when the thread is to end.
+// Returns false when the thread must end.
 bool InotifyNotifyService::adoptRegistrations() {
   std::vector<Registration> adopted;
   {
@@ -155,7 +157,7 @@ void InotifyNotifyService::arm() {
   noteNews();
 }
 
-// Whatever has changed, the links may have, and lead elsewhere now.
+// Any change may have been one of a link. Watches the new targets if links now lead elsewhere.
 void InotifyNotifyService::followLinks() {
   if (!settings_.hasNews()) return;
   if (settings_.linkedSettings() != linked_ ||
@@ -169,8 +171,8 @@ bool InotifyNotifyService::isNotifyLink(std::size_t directory, std::string_view 
   return directory >= first && notifyLinks_[directory - first].filename() == file;
 }
 
-// Whoever deletes the directory should read in the log why nothing is heard any more, and of its
-// return. One that has not been made yet is nothing to tell.
+// Logs that the notify directory was deleted, which explains why notifications stop, and that it is
+// back. A directory that was never created is not worth a line.
 void InotifyNotifyService::tellOfNotifyDirectory() {
   const bool isThere = watch_.isThere(kNotifyDirectory);
   if (isThere == std::exchange(hasNotifyDirectory_, isThere)) return;

@@ -20,17 +20,19 @@ namespace halvox::platform::linux_ {
 inline constexpr NotifyStatus kNotifyInvalidName = 1;
 inline constexpr NotifyStatus kNotifyFailed = 1'000'000;
 
-// Notifications that files post: a file of the name in the notify directory that is written,
-// touched, created or moved there, and a preference file of the user "mobile" whose values change
-// (see WatchedSettings for which names it posts). Several changes that come close together are one
-// post, a moment after the last of them, so that one save posts once however it is done; none is
-// lost.
+// Posts notifications when files change. A notification is posted when a file of its name in the
+// notify directory is written, touched, created or moved there, and when the values in a preference
+// file of the user "mobile" change (WatchedSettings says which names that posts). Changes shortly
+// after each other cause one post, so that one save posts once, however the editor saves. No change
+// is lost.
 //
-// A thread of its own waits for the files, from the first registration on; it sleeps while nothing
-// happens. Directories may be missing, and may be deleted and made again. Symbolic links on the way
-// to a preference file or to the directory of names are followed: a change behind them, or of one
-// of them, counts. When watching
-// fails (the kernel's limits) it says so once and tries again.
+// A thread of its own waits for changes, from the first registration on, without a timer. The
+// directories may be missing, and may be deleted and created again. Symbolic links on the way to a
+// preference file or to the notify directory are followed: a change of the target, and of a link,
+// counts. When the files cannot be watched, for example because of the kernel's limits, the thread
+// logs an error once and tries again every five seconds.
+//
+// Owned by the platform. Any thread may call. Handlers run on the queue of their registration.
 class InotifyNotifyService final : public NotifyService {
  public:
   // Does not own the reader and the statistics, which must outlive it.
@@ -40,11 +42,13 @@ class InotifyNotifyService final : public NotifyService {
   InotifyNotifyService& operator=(const InotifyNotifyService&) = delete;
   ~InotifyNotifyService() override { stop(); }
 
-  // Refuses names that cannot be those of files (kNotifyInvalidName). Reads files.
+  // Returns 0 and a new token, kNotifyInvalidName for a name that a file cannot have, or
+  // kNotifyFailed after stop() or when the thread cannot be started. Blocks on the disk.
   NotifyStatus notify_register_dispatch(std::string_view name, NotifyToken& token,
                                         std::shared_ptr<DispatchQueue> queue,
                                         Handler handler) override HALVOX_EXCLUDES(mutex_);
-  // Ends the thread: nothing is posted any more. Registrations are in vain from here on.
+  // Ends the thread and waits for it. Nothing is posted afterwards, and registrations fail.
+  // Idempotent.
   void stop() HALVOX_EXCLUDES(mutex_);
 
  private:
@@ -58,7 +62,7 @@ class InotifyNotifyService final : public NotifyService {
   };
 
   [[nodiscard]] bool ensureRunning() HALVOX_REQUIRES(mutex_);
-  // The rest runs on the thread.
+  // The functions below run on the thread.
   void run();
   [[nodiscard]] bool adoptRegistrations() HALVOX_EXCLUDES(mutex_);
   void arm();
@@ -70,18 +74,18 @@ class InotifyNotifyService final : public NotifyService {
   void deliver();
   [[nodiscard]] std::optional<Clock::time_point> nextWork() const;
 
-  // The directories that are always watched, in order; those of `linked_` and of `notifyLinks_`
-  // come behind them.
+  // The directories that are always watched. In the list for `watch_` the directories of `linked_`
+  // and then those of `notifyLinks_` follow.
   const std::vector<std::filesystem::path> directories_;
   DirectoryWatch watch_;
-  std::vector<LinkedSetting> linked_;               // as watched
-  std::vector<std::filesystem::path> notifyLinks_;  // the same for the directory of names
+  std::vector<LinkedSetting> linked_;               // of the preference files, as watched
+  std::vector<std::filesystem::path> notifyLinks_;  // of the notify directory, as watched
   bool hasNotifyDirectory_ = false;
   bool notifyDirectoryWasGone_ = false;
   WatchedSettings settings_;
   std::vector<Registration> registrations_;
-  std::optional<Clock::time_point> retryAt_;    // when watching is tried again
-  std::optional<Clock::time_point> firstNews_;  // since the last post
+  std::optional<Clock::time_point> retryAt_;    // when to try again to watch
+  std::optional<Clock::time_point> firstNews_;  // the first change since the last post
   Clock::time_point lastNews_;
   Counter& delivered_;
 

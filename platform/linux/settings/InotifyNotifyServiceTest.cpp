@@ -11,7 +11,7 @@ namespace {
 
 constexpr const char* kName = "org.example.changed";
 constexpr const char* kDomain = "org.example";
-// A name of which each test can see that all before it has been looked at.
+// Posting this name shows that all earlier changes have been handled.
 constexpr const char* kSentinel = "sentinel";
 
 class InotifyNotifyServiceTest : public SettingsTest {
@@ -30,13 +30,13 @@ class InotifyNotifyServiceTest : public SettingsTest {
   bool waitForPosts(NotifyToken token, int count) {
     return waitFor([&] { return posts(token) >= count; });
   }
-  // Everything that happened before has been looked at once this is back.
+  // Waits until all earlier changes have been handled.
   void waitUntilSettled() {
     const int before = posts(sentinel_);
     write(notify() / kSentinel, "");
     ASSERT_TRUE(waitForPosts(sentinel_, before + 1));
   }
-  // The sentinel comes last, so that what is posted with it is posted before it.
+  // Registers the sentinel last, so that other names of the same post come before it.
   void begin() {
     ASSERT_EQ(service_.notify_register_dispatch(kName, name_, queue_,
                                                 [this](NotifyToken fired) { ++posts_[fired]; }),
@@ -46,7 +46,7 @@ class InotifyNotifyServiceTest : public SettingsTest {
               0U);
     waitUntilSettled();
   }
-  // One way of saving: the posts that it leads to.
+  // Returns the number of posts that a change causes.
   int postsOf(const std::function<void()>& change) {
     const int before = posts(name_);
     change();
@@ -296,7 +296,7 @@ TEST_F(InotifyNotifyServiceTest, AFileThatBecomesALinkIsFollowed) {
   EXPECT_EQ(postsOf([&] { write(scratch_ / "two", "a = 22"); }), 1);
 }
 
-// As settings are kept that are replaced all at once.
+// Settings that are replaced all at once are often kept in this way.
 TEST_F(InotifyNotifyServiceTest, ALinkedDirectoryOnTheWayIsFollowed) {
   const auto directory = preferences() / "mobile";
   write(directory / "..1" / "org.example.toml", "a = 1");
@@ -347,7 +347,7 @@ TEST_F(InotifyNotifyServiceTest, NoPreferenceIsMissedInAFloodOfEvents) {
   begin();
   std::filesystem::create_directories(preferences() / "mobile");
 
-  // Far more than the kernel keeps for a reader that is behind.
+  // Far more events than the kernel queues for a slow reader.
   for (int turn = 0; turn < 20'000; ++turn) {
     const auto other = preferences() / "mobile" / ("x" + std::to_string(turn % 7));
     ::close(::open(other.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600));

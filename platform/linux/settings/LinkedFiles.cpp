@@ -9,7 +9,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// As many as the kernel follows.
+// The kernel follows no more (path_resolution(7)).
 constexpr std::size_t kMostLinks = 40;
 
 }  // namespace
@@ -26,7 +26,7 @@ std::vector<fs::path> linkedFiles(const fs::path& path) {
       way = way.parent_path();
       continue;
     }
-    const fs::path next = way / part;  // an absolute part begins anew
+    const fs::path next = way / part;  // "/" as part, from an absolute link, starts at the root
     std::error_code isNoLink;
     const fs::path target = fs::read_symlink(next, isNoLink);
     if (isNoLink) {

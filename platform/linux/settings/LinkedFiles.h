@@ -5,10 +5,10 @@
 
 namespace halvox::platform::linux_ {
 
-// What an absolute path depends on beside its own directory: every symbolic link on the way to it,
-// in the order in which they are followed, and then the file that they lead to, whether it is there
-// or not. The directories of these paths have no links in them. Empty when there is no link on the
-// way; links that never end are followed for a while.
+// Returns the files that an absolute path depends on when it contains symbolic links: each link, in
+// the order in which the kernel follows them, and last the file that they lead to, which need not
+// exist. The directories of the returned paths contain no links. Returns an empty list for a path
+// without links. Stops after 40 links, as the kernel does. Blocks on the disk.
 std::vector<std::filesystem::path> linkedFiles(const std::filesystem::path& path);
 
 }  // namespace halvox::platform::linux_

@@ -25,7 +25,7 @@ bool isUtf8(std::string_view text) {
   return true;
 }
 
-// A TOML string on one line.
+// Returns a text as a TOML string on one line.
 std::string quotedText(std::string_view text) {
   std::string quoted = "\"";
   for (const char character : text) {
@@ -52,7 +52,7 @@ std::string keyText(std::string_view key) {
   return isBare ? std::string(key) : quotedText(key);
 }
 
-// Where a position of the parser, which counts lines and characters from 1, is in the text.
+// Converts a position of the parser, which counts lines and characters from 1, to a byte offset.
 std::size_t offsetOf(std::string_view text, toml::source_position position) {
   std::size_t offset = 0;
   // The parser does not count a byte order mark.
@@ -78,7 +78,8 @@ std::size_t lineEnd(std::string_view text, std::size_t offset) {
   return end == std::string_view::npos ? text.size() : end + 1;
 }
 
-// True for what stands behind "key =": tables may also have headers and dotted keys of their own.
+// Returns true for a value that is written as "key = value". Tables may also be written with
+// headers or dotted keys; changing those would need more than the lines of the key.
 bool standsBehindItsKey(const toml::node& node) {
   const toml::table* table = node.as_table();
   if (table != nullptr) return table->is_inline();
@@ -87,7 +88,7 @@ bool standsBehindItsKey(const toml::node& node) {
          (!array->empty() && array->get(0)->as_table()->is_inline());
 }
 
-// The text of a file and what the parser says of it.
+// The text of a file and its parse result.
 class ParsedText {
  public:
   ParsedText(std::string_view text, const std::filesystem::path& file)
@@ -113,7 +114,8 @@ class ParsedText {
     return offsetOf(text_, node.source().end);
   }
 
-  // Where a new key of the first level goes: behind the last one, or in front of the first table.
+  // The offset for a new top-level key: after the last one, else before the first table. After a
+  // table header it would belong to that table.
   [[nodiscard]] std::size_t placeForNewKey() const {
     std::size_t behind = 0;
     std::size_t firstTable = text_.size();
@@ -133,7 +135,7 @@ class ParsedText {
   toml::parse_result parsed_;
 };
 
-// The edited text when it means what it should.
+// Returns the edited text if it has the expected values, else an error.
 Edited verified(std::string text, const Dictionary& expected, const ParsedText& before,
                 std::string_view key, const std::filesystem::path& file) {
   const auto after = parsePreferences(text, file);
@@ -164,7 +166,7 @@ std::variant<PreferenceValue, PreferenceFileError> parsePreferenceValue(std::str
     constexpr std::string_view kKey = "v = ";
     const std::string line = std::string(kKey) + std::string(text);
     const toml::parse_result parsed = toml::parse(line);
-    // What holds more than one value or a comment is no value but a text that looks like one.
+    // Text that contains a comment, or more than one value, is a string that looks like TOML.
     if (parsed && parsed.table().size() == 1 && standsBehindItsKey(*parsed.table().get("v")) &&
         offsetOf(line, parsed.table().get("v")->source().end) == line.size()) {
       return PreferenceValue{std::string(text), toValue(*parsed.table().get("v"))};

@@ -10,12 +10,12 @@
 
 namespace halvox::platform::linux_ {
 
-// Changes of single preferences in the text of a file. Everything else in the text (comments,
-// order, spacing) stays as it is. A change that would need more than the lines of that key is
-// refused, and every result is read again before it is given: it means what was asked for, or
-// nothing is given.
+// Changes single preferences in the text of a file and keeps everything else as it is: comments,
+// order and spacing. Refuses a change that would need more than the lines of its key. Parses every
+// result again and returns it only when it has the intended values. Pure functions: any thread may
+// call.
 
-// A value as it stands in a file, and what it means.
+// A value as TOML text, and its meaning.
 struct PreferenceValue {
   std::string text;
   Value value;
@@ -23,18 +23,20 @@ struct PreferenceValue {
 
 enum class ValueForm : unsigned char { kTomlOrString, kString };
 
-// What a user wrote as a value: any TOML value (7, true, "text", [1, 2], 2026-03-01), and what is
-// none is a string. With kString it is always one. An error when it is not UTF-8.
+// Interprets what a user wrote as a value. Text that is one TOML value (7, true, "text", [1, 2],
+// 2026-03-01) is that value; any other text, or every text with kString, is a string. Returns an
+// error if the text is not UTF-8.
 std::variant<PreferenceValue, PreferenceFileError> parsePreferenceValue(std::string_view text,
                                                                         ValueForm form);
 
-// The text with a key of the first level set to a value, in its place or as a new line behind the
-// other keys of the first level. `file` is for messages.
+// Returns the text with a top-level key set to a value. Changes the key where it stands, or adds a
+// line after the other top-level keys. `file` is only for error messages.
 std::variant<std::string, PreferenceFileError> withPreference(std::string_view text,
                                                               std::string_view key,
                                                               const PreferenceValue& value,
                                                               const std::filesystem::path& file);
-// The text without a key of the first level and its lines; the same text when it has no such key.
+// Returns the text without a top-level key and its lines. Returns the same text if it has no such
+// key.
 std::variant<std::string, PreferenceFileError> withoutPreference(std::string_view text,
                                                                  std::string_view key,
                                                                  const std::filesystem::path& file);

@@ -40,7 +40,7 @@ PreferenceFileError tooLarge(const std::filesystem::path& file, std::size_t size
 
 std::variant<std::optional<PreferenceText>, PreferenceFileError> readText(
     const std::filesystem::path& file) {
-  // Opening does not block, so that a pipe nobody writes to cannot hold anybody up.
+  // O_NONBLOCK: opening a pipe without a writer would block.
   const UniqueFd descriptor(::open(file.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
   if (!descriptor) {
     if (errno == ENOENT || errno == ENOTDIR) return std::nullopt;
@@ -61,7 +61,7 @@ std::variant<std::optional<PreferenceText>, PreferenceFileError> readText(
     if (count == 0) return content;
     content.text.append(buffer.data(), static_cast<std::size_t>(count));
   }
-  return tooLarge(file, 0);  // it grew meanwhile
+  return tooLarge(file, 0);  // the file grew after fstat()
 }
 
 }  // namespace

@@ -11,39 +11,40 @@
 
 namespace halvox::platform::linux_ {
 
-// Files of preferences: one TOML file per user and domain.
+// Preference files: one TOML file for each user and domain. These functions block on the disk, and
+// any thread may call them.
 
-// Whose files count: named suites and the watched settings are this user's.
+// The user whose files hold the named suites and the watched settings.
 inline constexpr std::string_view kPreferenceUser = "mobile";
-// Larger files are not read: reading must not hold anybody up.
+// Larger files are refused: callers on the service's queues wait for the reading.
 inline constexpr std::size_t kLargestPreferenceFile = 1U << 20U;
 
-// Why a file cannot be read or changed: one line for the user, which begins with the file and, for
-// a mistake in it, "FILE:LINE:COLUMN: ".
+// Why a file cannot be read or changed: one line for the user that begins with the file name, or
+// with "FILE:LINE:COLUMN: " for a mistake in the file.
 struct PreferenceFileError {
   std::string description;
 };
 
-// What a file holds and which state of which file that was.
+// The content and the permissions of a file.
 struct PreferenceText {
   std::string text;
   unsigned mode = 0;  // permission bits
 };
 
-// The file of that domain of that user; none when one of the names may not become a file's.
+// Returns the path of a domain's file; std::nullopt when a name is not usable in a path.
 std::optional<std::filesystem::path> preferencePath(const std::filesystem::path& directory,
                                                     std::string_view user, std::string_view domain);
 
-// The text of a file; none when there is no such file. Reads regular files of limited size and
-// nesting only and never waits for a writer.
+// Returns the text of a file; std::nullopt when there is no such file. Accepts only regular files
+// within the limits of size and nesting, and never waits for another process.
 std::variant<std::optional<PreferenceText>, PreferenceFileError> readPreferenceText(
     const std::filesystem::path& file);
 
-// The values that a text means. `file` is for the message.
+// Returns the values in a text. `file` is only for the error message.
 std::variant<Dictionary, PreferenceFileError> parsePreferences(std::string_view text,
                                                                const std::filesystem::path& file);
 
-// Both of it: the values of a file, empty when there is no such file.
+// Returns the values in a file; empty when there is no such file.
 std::variant<Dictionary, PreferenceFileError> readPreferences(const std::filesystem::path& file);
 
 }  // namespace halvox::platform::linux_

@@ -13,10 +13,10 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr UnitLog kLog(settingsCategory, "PreferenceReader");
-// Beyond this everything is forgotten, and may be told again.
+// With more entries, all are forgotten, and a mistake may be logged a second time.
 constexpr std::size_t kMostTold = 64;
 
-// Which state of a file it is: a file that was saved again with the same mistake is told again.
+// Identifies the state of a file, so that a file saved again with the same mistake is logged again.
 std::string stateOf(const std::filesystem::path& file) {
   struct stat status {};
   if (::stat(file.c_str(), &status) != 0) return {};

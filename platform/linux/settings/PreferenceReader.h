@@ -11,9 +11,10 @@
 
 namespace halvox::platform::linux_ {
 
-// Reads preference files for the service and tells in the log what is wrong with them: once for
-// each mistake and state of a file, however often it is read, and once more when it is mended. Any
-// thread may call; reads a file each time.
+// Reads preference files for the service, and logs what is wrong with them. A mistake is logged
+// once for each state of the file, however often the file is read; that it was fixed is logged once
+// too. Owned by the platform. Any thread may call. Reads the file on each call, so it blocks on the
+// disk.
 class PreferenceReader {
  public:
   explicit PreferenceReader(std::filesystem::path directory) : directory_(std::move(directory)) {}
@@ -21,8 +22,8 @@ class PreferenceReader {
   PreferenceReader& operator=(const PreferenceReader&) = delete;
 
   [[nodiscard]] const std::filesystem::path& directory() const { return directory_; }
-  // The values of a domain, empty when it has no file; none when a name is refused or the file
-  // cannot be read.
+  // Returns the values of a domain; empty when the domain has no file. Returns std::nullopt, after
+  // logging, when a name is not usable or the file cannot be read.
   [[nodiscard]] std::optional<Dictionary> read(std::string_view user, std::string_view domain) const
       HALVOX_EXCLUDES(mutex_);
 
@@ -33,7 +34,7 @@ class PreferenceReader {
 
   const std::filesystem::path directory_;
   mutable Mutex mutex_;
-  // What was told last of each file or refused name that is wrong. Bounded.
+  // What was logged last about each bad file or name. Bounded, because clients choose names.
   mutable std::map<std::string, std::string, std::less<>> told_ HALVOX_GUARDED_BY(mutex_);
 };
 

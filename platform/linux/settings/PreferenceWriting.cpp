@@ -17,14 +17,14 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// For others to read, as far as the process's mask allows.
+// Readable by everyone, as far as the umask allows.
 constexpr mode_t kModeOfNewFiles = 0644;
 
 PreferenceFileError failure(const std::filesystem::path& path, int error) {
   return {path.native() + ": " + std::system_category().message(error)};
 }
 
-// A file that is not named yet; it goes when it is not kept.
+// A file under a temporary name beside its target. The destructor deletes it unless it was kept.
 class NewFile {
  public:
   explicit NewFile(const std::filesystem::path& target)
@@ -46,7 +46,7 @@ class NewFile {
     }
     return ::fsync(descriptor_.get()) == 0;
   }
-  // Takes the place of `target`.
+  // Renames the file to `target` and replaces a file of that name.
   [[nodiscard]] bool keepAs(const std::filesystem::path& target) {
     isKept_ = ::rename(path_.c_str(), target.c_str()) == 0;
     return isKept_;
@@ -72,20 +72,21 @@ std::optional<PreferenceFileError> replace(const std::filesystem::path& file,
   return std::nullopt;
 }
 
-// False when it cannot be locked, or is not free within that time.
+// Locks the directory. Returns false when that fails or takes longer than `patience`.
 bool lock(int directory, std::chrono::milliseconds patience) {
   constexpr std::chrono::milliseconds kPause{10};
   const auto end = std::chrono::steady_clock::now() + patience;
   while (::flock(directory, LOCK_EX | LOCK_NB) != 0) {
     if (errno == EINTR) continue;
     if (errno != EWOULDBLOCK || std::chrono::steady_clock::now() >= end) return false;
-    // The system tells nobody when a lock becomes free.
+    // flock() has no timeout, and the system does not announce that a lock is free. Try again.
     std::this_thread::sleep_for(kPause);
   }
   return true;
 }
 
-// The file that a link stands for, be it there or not, so that the link stays.
+// Returns the file that a symbolic link leads to, which need not exist. Replacing that file instead
+// of the link keeps the link.
 std::filesystem::path target(const std::filesystem::path& file) {
   std::error_code error;
   auto real = std::filesystem::canonical(file, error);

@@ -12,15 +12,18 @@
 
 namespace halvox::platform::linux_ {
 
-// What becomes of a file's text.
+// Returns the new text of a file, or an error that leaves the file as it is.
 using PreferenceEdit = std::function<std::variant<std::string, PreferenceFileError>(
     std::string_view text, const std::filesystem::path& file)>;
 
-// Changes a preference file as a whole or not at all: what is written is on the disk before it
-// takes the old file's place, with the same permissions. Makes the file and its directories when
-// they are missing. Others who change files of that directory in the same way wait, for so long at
-// most, so that no change is lost. A file that would stay as it is is not written. Gives what went
-// wrong.
+// Changes a preference file completely or not at all: the new text is on the disk before it
+// replaces the old file, whose permissions it keeps. If the file is a symbolic link, the link stays
+// and its target changes. Creates a missing file and its directories. Does not write a file whose
+// text stays the same.
+//
+// Holds a lock on the directory meanwhile, so that two programs that change files in this way do
+// not lose a change. Waits for that lock at most `patience`, because anyone who may read the
+// directory can hold it. Blocks on the disk. Returns an error, or std::nullopt on success.
 std::optional<PreferenceFileError> changePreferenceFile(
     const std::filesystem::path& named, const PreferenceEdit& edit,
     std::chrono::milliseconds patience = std::chrono::seconds(5));

@@ -5,12 +5,12 @@
 
 namespace halvox::platform::linux_ {
 
-// Whether a name from outside (a user, a domain, a notification) may become the name of a file: not
-// empty, not "." or "..", without "/" and NUL, and short enough for a file system with whatever
-// ending the file gets.
+// Returns true when a name from outside (of a user, a domain or a notification) may become part of
+// a file name. It must not be empty, "." or "..", must not contain "/" or NUL, and may have at most
+// 200 bytes, which leaves room for an extension.
 bool isUsableName(std::string_view name);
 
-// A name in quotes, shortened and on one line, as messages show one that is not usable.
+// Returns a name for use in a message: in quotes, escaped, on one line and at most 60 bytes long.
 std::string shownName(std::string_view name);
 
 }  // namespace halvox::platform::linux_

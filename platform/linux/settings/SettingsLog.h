@@ -5,6 +5,7 @@
 
 namespace halvox::platform::linux_ {
 
+// The log category of everything in this folder.
 inline LogCategory& settingsCategory() {
   static LogCategory& category = platform::log().createCategory("com.tarno.halvox", "settings");
   return category;

@@ -15,8 +15,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Directories of preferences and of notifications that a test may do with what it likes; neither is
-// there at first.
+// A fixture with directories for preferences and notifications. Neither exists at first.
 class SettingsTest : public testing::Test {
  protected:
   [[nodiscard]] std::filesystem::path preferences() const { return scratch_ / "preferences"; }
@@ -32,7 +31,7 @@ class SettingsTest : public testing::Test {
     std::ifstream stream(file, std::ios::binary);
     return {std::istreambuf_iterator<char>(stream), {}};
   }
-  // Looks again and again until the condition holds; false when it does not in time.
+  // Tests the condition every millisecond until it holds. Returns false after 20 seconds.
   static bool waitFor(const std::function<bool()>& condition) {
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
     while (!condition()) {
@@ -41,7 +40,7 @@ class SettingsTest : public testing::Test {
     }
     return true;
   }
-  // How many log lines have that text in them.
+  // Returns the number of log lines that contain a text.
   [[nodiscard]] std::size_t linesWith(std::string_view text) const {
     std::size_t count = 0;
     for (const auto& line : platform_.log.texts()) count += line.find(text) != std::string::npos;

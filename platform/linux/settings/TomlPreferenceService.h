@@ -6,12 +6,15 @@
 
 namespace halvox::platform::linux_ {
 
-// Preferences in TOML files, `<directory>/<user>/<domain>.toml`; suites are domains of the user
-// "mobile". Nothing is kept between calls: each one reads and parses the file, so that no change
-// can be missed whatever the clock of the file system does. Any thread may call.
+// Preferences from TOML files, `<directory>/<user>/<domain>.toml`. Suites are domains of the user
+// "mobile". Keeps nothing between calls: each call reads and parses the file. A cache would have to
+// rely on time stamps, and two saves within one tick of the file system's clock have the same.
+//
+// Owned by the platform. Any thread may call; blocks on the disk. A file that cannot be read counts
+// as absent; PreferenceReader logs why.
 class TomlPreferenceService final : public PreferenceService {
  public:
-  // Does not own these, which must outlive it.
+  // Does not own its arguments, which must outlive it.
   TomlPreferenceService(const PreferenceReader& reader, StatisticsService& statistics);
 
   [[nodiscard]] std::optional<Value> CFPreferencesCopyValue(

@@ -28,7 +28,7 @@ double secondsInLocalTime(const toml::date& date, const toml::time& time) {
   fields.tm_hour = time.hour;
   fields.tm_min = time.minute;
   fields.tm_sec = time.second;
-  fields.tm_isdst = -1;  // whatever holds at that moment
+  fields.tm_isdst = -1;  // the C library finds out whether daylight saving time applies
   return static_cast<double>(std::mktime(&fields));
 }
 

@@ -1,8 +1,8 @@
 #pragma once
 
-// Private to the settings: what the nodes of a parsed file mean.
+// Converts parsed TOML to values. Include it only in sources of this folder: the parser is large.
 
-#define TOML_HEADER_ONLY 0  // the parser is compiled once, for the configuration
+#define TOML_HEADER_ONLY 0  // the configuration's source compiles the parser
 #define TOML_EXCEPTIONS 0
 #include <toml++/toml.h>
 
@@ -10,8 +10,9 @@
 
 namespace halvox::platform::linux_ {
 
-// The property-list value of a node. A date without an offset is in the machine's time zone, one
-// without a time its first moment. A time without a date is its text: no property list has these.
+// Returns the property-list value of a node. A date-time without an offset is in the machine's time
+// zone, and a date without a time is its first moment. A time without a date becomes a text:
+// property lists have no such type.
 Value toValue(const toml::node& node);
 Dictionary toDictionary(const toml::table& table);
 

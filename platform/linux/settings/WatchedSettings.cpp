@@ -14,7 +14,7 @@ constexpr std::string_view kPiece = "notifications";
 constexpr std::string_view kPreferenceEnding = ".toml";
 constexpr std::int64_t kNanoseconds = 1'000'000'000;
 
-// Every name that `name` begins with, up to a dot or to its end.
+// Returns the domains that a name belongs to: "a", "a.b" and "a.b.c" for "a.b.c".
 std::vector<std::string> domainsOf(const std::string& name) {
   std::vector<std::string> domains;
   for (std::size_t dot = name.find('.'); dot != std::string::npos; dot = name.find('.', dot + 1)) {
@@ -48,7 +48,7 @@ std::optional<FileMark> WatchedSettings::mark(const std::string& name) const {
 SettingBaseline WatchedSettings::look(const std::string& name) const {
   SettingBaseline baseline{mark(name)};
   for (const std::string& domain : domainsOf(name)) {
-    // What cannot be read counts as absent, so that its mending is a change.
+    // A file that cannot be read counts as empty. Fixing it is then a change.
     baseline.domains[domain] = reader_.read(kPreferenceUser, domain).value_or(Dictionary());
   }
   return baseline;
@@ -118,8 +118,8 @@ bool WatchedSettings::settleName(const std::string& name) {
   return isNews;
 }
 
-// What cannot be read is no change: its readers heard of the values before, and hear again when it
-// is mended with other values.
+// A file that cannot be read is not a change. Listeners keep the values from before, and are
+// notified when the file is fixed and has other values.
 bool WatchedSettings::settleDomain(const std::string& domain) {
   auto now = reader_.read(kPreferenceUser, domain);
   if (!now.has_value()) {

@@ -14,65 +14,67 @@
 
 namespace halvox::platform::linux_ {
 
-// Which file of which name it was, so that another one, or a touch, is told from it.
+// Identifies the state of a file, to notice that it was touched or replaced by another.
 struct FileMark {
   std::uint64_t inode = 0;
   std::int64_t changedAt = 0;  // nanoseconds
   friend bool operator==(const FileMark&, const FileMark&) = default;
 };
 
-// A file, beside those in the directory of preferences, on which the values of a domain depend.
+// A file outside the preference directory on which the values of a domain depend: a symbolic link
+// or its target.
 struct LinkedSetting {
   std::filesystem::path file;
   std::string domain;
   friend bool operator==(const LinkedSetting&, const LinkedSetting&) = default;
 };
 
-// How everything that posts one name looked at some moment.
+// The state of all files that can post one name, at one moment.
 struct SettingBaseline {
-  std::optional<FileMark> file;                 // of that name in the notify directory
-  std::map<std::string, Dictionary> domains{};  // values of the domains that the name belongs to
+  std::optional<FileMark> file;                 // the file of that name in the notify directory
+  std::map<std::string, Dictionary> domains{};  // the values of the name's domains
 };
 
-// Decides which notifications are to be posted after files have changed.
+// Decides which notifications to post after files have changed.
 //
-// A name is posted by a file of its name in the notify directory, and by a change of the values of
-// a domain that it belongs to: the name begins with the domain's name and a dot, or is equal to it.
-// So nobody has to say what belongs together, and a domain that is set up later needs no change
-// here.
+// A name is posted when the file of that name in the notify directory changes, and when the values
+// of a domain change to which the name belongs: the name equals the domain, or begins with the
+// domain and a dot. No list has to connect names and domains, and a new domain works at once.
 //
-// Holds what it saw last of each file, so that it also finds changes that nobody told it of.
-// Belongs to one thread; reads files.
+// Remembers the last state of each file and compares with it, so that it also finds changes that
+// were not announced. A preference file that cannot be read counts as unchanged until it can.
+// Owned by InotifyNotifyService and used on its thread, except look(). Blocks on the disk.
 class WatchedSettings {
  public:
-  // Does not own these, which must outlive it.
+  // Does not own the reader and the statistics, which must outlive it.
   WatchedSettings(std::filesystem::path notifyDirectory, const PreferenceReader& reader,
                   StatisticsService& statistics);
 
-  // What a name's files are like now. Any thread may call.
+  // Returns the current state of the files of a name. Any thread may call.
   [[nodiscard]] SettingBaseline look(const std::string& name) const;
-  // Watches a name from the state that `baseline` tells of; what has changed since is news.
+  // Starts to watch a name. Changes since `baseline` was taken count.
   void add(const std::string& name, SettingBaseline&& baseline);
 
-  // A file in the notify directory was written, touched, created or moved there. That posts its
-  // name even when the file is gone again, or looks as it did before.
+  // Notes that a file in the notify directory was written, touched, created or moved there. This
+  // posts its name even if the file was deleted again or looks the same as before.
   void noteNotifyFile(std::string_view file);
-  // A file in the directory of preferences has changed.
+  // Notes that a file in the preference directory has changed.
   void notePreferenceFile(std::string_view file);
-  // What the file of that domain leads to has changed.
+  // Notes that the target of a domain's file has changed.
   void noteDomain(std::string_view domain);
-  // Anything may have changed.
+  // Notes that anything may have changed.
   void noteEverything();
 
-  // The symbolic links on the way to the files of all domains, and what they lead to now.
+  // Returns the symbolic links on the way to the files of all domains, and their targets.
   [[nodiscard]] std::vector<LinkedSetting> linkedSettings() const;
 
+  // Returns true when something was noted since the last settle().
   [[nodiscard]] bool hasNews() const { return !names_.news.empty() || !domains_.news.empty(); }
-  // Looks at all that was noted, and gives the names to post, each once.
+  // Examines everything that was noted and returns the names to post, each once.
   [[nodiscard]] std::set<std::string> settle();
 
  private:
-  // What is known of each, and which of them to look at.
+  // The known state of each name or domain, and those that must be examined.
   template <typename Known>
   struct Watched {
     std::map<std::string, Known, std::less<>> known;
