@@ -1,0 +1,1 @@
+"""Changes sources in small ways and looks whether the tests notice. See scripts/mutate."""

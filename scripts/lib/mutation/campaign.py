@@ -1,0 +1,166 @@
+"""Chooses mutants, tries them, and reports what became of them."""
+
+import collections
+import random
+import re
+import shutil
+import threading
+import time
+from concurrent.futures import ThreadPoolExecutor
+from dataclasses import dataclass
+
+from .mutants import mutants_of
+
+_TEST_FILE = re.compile(r"(Test|Fixture)\.(h|cpp)$")
+# Makes the objects and runs them; nothing of it is linked into a unit test.
+_COMPOSITION_ROOT = "service/main.cpp"
+
+NOT_COMPILED, KILLED, SURVIVED = "not compiled", "killed", "survived"
+
+
+@dataclass
+class Outcome:
+    mutant: object
+    state: str
+    by: str = ""  # what noticed it
+    seconds: float = 0.0
+
+
+def sources_in(root, folders):
+    """The sources of folders that are no tests, as paths from the root."""
+    found = []
+    for folder in folders:
+        for path in sorted((root / folder).rglob("*")):
+            name = str(path.relative_to(root))
+            if path.suffix in {".cpp", ".h"} and not _TEST_FILE.search(name) \
+                    and "/testdata/" not in name and name != _COMPOSITION_ROOT:
+                found.append(name)
+    return found
+
+
+class Choice:
+    """The mutants of a file in a random order of their places, then those of the places again."""
+
+    def __init__(self, file, places, generator):
+        self.file = file
+        self.places = len(places)
+        rounds = collections.defaultdict(list)
+        for place in places:
+            for turn, mutant in enumerate(generator.sample(place, len(place))):
+                rounds[turn].append(mutant)
+        self._order = []
+        for turn in sorted(rounds):
+            self._order += generator.sample(rounds[turn], len(rounds[turn]))
+
+    def next(self):
+        return self._order.pop(0) if self._order else None
+
+
+def shares(choices, count):
+    """How many of `count` mutants each file gets: in proportion to its places, the remainder to the
+    largest fractions."""
+    total = sum(choice.places for choice in choices)
+    exact = {choice.file: count * choice.places / total for choice in choices}
+    given = {file: int(share) for file, share in exact.items()}
+    by_fraction = sorted(exact, key=lambda file: (given[file] - exact[file], file))
+    for file in by_fraction[:count - sum(given.values())]:
+        given[file] += 1
+    return given
+
+
+class Campaign:
+    def __init__(self, tree, jobs, say):
+        self._tree = tree
+        self._jobs = jobs
+        self._say = say
+        self._lock = threading.Lock()
+        self._number = 0
+        self.outcomes = []
+
+    def run_chosen(self, files, count, seed):
+        """Tries that many mutants that compile, spread over the files."""
+        generator = random.Random(seed)
+        choices = [Choice(file, mutants_of(file, self._tree.text(file)), generator) for file in files]
+        choices = [choice for choice in choices if choice.places]
+        given = shares(choices, count)
+
+        def one_of(choice):
+            # A mutant that does not compile is replaced by the next of its file.
+            while (mutant := choice.next()) is not None:
+                if self._record(mutant).state != NOT_COMPILED:
+                    return
+
+        # One file after the other would leave the choice to the order in which jobs end; each file
+        # is one job at a time, so that a seed always gives the same mutants.
+        def all_of(choice):
+            for _ in range(given[choice.file]):
+                one_of(choice)
+
+        self._in_parallel(all_of, sorted(choices, key=lambda choice: -given[choice.file]))
+
+    def run_all(self, mutants):
+        self._in_parallel(self._record, mutants)
+
+    def _in_parallel(self, work, items):
+        with ThreadPoolExecutor(self._jobs) as pool:
+            for done in [pool.submit(work, item) for item in items]:
+                done.result()
+
+    def _record(self, mutant):
+        with self._lock:
+            self._number += 1
+            directory = self._tree.scratch(self._number)
+        begin = time.monotonic()
+        try:
+            outcome = self._try(mutant, directory)
+        finally:
+            shutil.rmtree(directory, ignore_errors=True)
+        outcome.seconds = time.monotonic() - begin
+        with self._lock:
+            self.outcomes.append(outcome)
+            self._say(f"{outcome.state:12} {outcome.seconds:5.1f} s  {mutant}"
+                      + (f"  [{outcome.by}]" if outcome.by else ""))
+        return outcome
+
+    def _try(self, mutant, directory):
+        changed = directory / mutant.file
+        changed.parent.mkdir(parents=True)
+        changed.write_text(mutant.apply(self._tree.text(mutant.file)))
+        objects = {}
+        for program in self._tree.programs_for(mutant.folder):
+            wanted = self._tree.objects_with(mutant.file, program)
+            for one in wanted:
+                if one not in objects:
+                    objects[one] = self._tree.compile(one, mutant.file, directory)
+                if objects[one] is None:
+                    return Outcome(mutant, NOT_COMPILED)
+            if not wanted:
+                continue
+            path = directory / program.name
+            if not program.link({one: objects[one] for one in wanted}, path):
+                return Outcome(mutant, NOT_COMPILED)
+            how, test = program.fails(path, directory)
+            path.unlink()
+            if how is not None:
+                return Outcome(mutant, KILLED, f"{how} {test or program.name}")
+        return Outcome(mutant, SURVIVED)
+
+
+def report(outcomes, folders, say):
+    """Prints the survivors and a table; the outcomes that compiled."""
+    compiled = [one for one in outcomes if one.state != NOT_COMPILED]
+    survivors = sorted((one for one in compiled if one.state == SURVIVED),
+                       key=lambda one: (one.mutant.file, one.mutant.start, one.mutant.kind))
+    if survivors:
+        say("\nSurvivors:")
+        for one in survivors:
+            say(f"  {one.mutant}")
+    say(f"\n{'folder':12}{'compiled':>9}{'killed':>8}{'survived':>10}{'':>8}{'not compiled':>14}")
+    for folder in [*folders, "all"]:
+        states = collections.Counter(one.state for one in outcomes
+                                     if folder in (one.mutant.folder, "all"))
+        total = states[KILLED] + states[SURVIVED]
+        share = f"{100 * states[SURVIVED] / total:.1f} %" if total else "-"
+        say(f"{folder:12}{total:9}{states[KILLED]:8}{states[SURVIVED]:10}{share:>8}"
+            f"{states[NOT_COMPILED]:14}")
+    return compiled
