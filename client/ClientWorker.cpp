@@ -37,9 +37,9 @@ class SignalsBlocked {
 };
 
 Options withDefaults(Options options) {
-  if (options.socketPath.empty()) options.socketPath = defaultSocketPath();
   options.requestTimeout =
       std::min<std::chrono::milliseconds>(options.requestTimeout, kLongestWait);
+  options.samePlaceFor = std::min<std::chrono::milliseconds>(options.samePlaceFor, kLongestWait);
   options.reconnectMax = std::min<std::chrono::milliseconds>(options.reconnectMax, kLongestWait);
   options.reconnectMin = std::min(options.reconnectMin, options.reconnectMax);
   options.reconnectMin = std::max(options.reconnectMin, std::chrono::milliseconds(1));
@@ -51,9 +51,10 @@ Options withDefaults(Options options) {
 
 ClientWorker::ClientWorker(Options options)
     : options_(withDefaults(std::move(options))),
+      places_(socketPlaces(options_.socketPath)),
       ring_(options_.maxPendingMessages, options_.maxPendingBytes),
       wakeUp_(eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)),
-      watch_(options_.socketPath),
+      watch_(places_),
       pause_(options_.reconnectMin) {
   const SignalsBlocked blocked;
   thread_ = std::jthread([this] { run(); });
@@ -127,6 +128,11 @@ void ClientWorker::setConnectionHandler(std::function<void(bool)> handler) {
     handlerIsNew_ = handler_ != nullptr;
   }
   wake();
+}
+
+std::string ClientWorker::socketPath() const {
+  const MutexLock lock(mutex_);
+  return shownPlace_;
 }
 
 Counters ClientWorker::counters() const {

@@ -8,7 +8,9 @@
 #include <list>
 #include <memory>
 #include <optional>
+#include <string>
 #include <thread>
+#include <vector>
 
 #include <poll.h>
 
@@ -57,6 +59,7 @@ class ClientWorker {
   void setConnectionHandler(std::function<void(bool)> handler);
   // Orders with nothing: it is news about the past either way.
   [[nodiscard]] bool isConnected() const { return connected_.load(std::memory_order_relaxed); }
+  [[nodiscard]] std::string socketPath() const;
   [[nodiscard]] Counters counters() const;
 
  private:
@@ -91,6 +94,7 @@ class ClientWorker {
 
   // The connection.
   void tryConnect();
+  [[nodiscard]] std::vector<std::string> placesToTry() const;
   void processBus();
   void onReady();
   void loseConnection();
@@ -115,6 +119,7 @@ class ClientWorker {
   void finishFlushes();
 
   const Options options_;
+  const std::vector<std::string> places_;  // where the service may be, in the order of trying
   MessageRing ring_;
   platform::linux_::UniqueFd wakeUp_;
   std::atomic<bool> asleep_{false};  // sequentially consistent with the slots of the ring
@@ -130,7 +135,7 @@ class ClientWorker {
   // come before its messages because a message is published after it.
   std::atomic<std::uint64_t> lanePosition_{UINT64_MAX};
 
-  platform::linux_::Mutex mutex_;
+  mutable platform::linux_::Mutex mutex_;
   platform::linux_::Condition flushed_;
   std::deque<LaneEntry> lane_ HALVOX_GUARDED_BY(mutex_);
   SessionTable wanted_ HALVOX_GUARDED_BY(mutex_);  // after all operations that were posted
@@ -140,12 +145,15 @@ class ClientWorker {
   FlushTicket flushAsked_ HALVOX_GUARDED_BY(mutex_) = 0;
   FlushTicket flushDone_ HALVOX_GUARDED_BY(mutex_) = 0;
   bool endNow_ HALVOX_GUARDED_BY(mutex_) = false;
+  std::string shownPlace_ HALVOX_GUARDED_BY(mutex_);  // of the present or last connection
 
   // The worker's own.
   SocketWatch watch_;
   State state_ = State::kAbsent;
   TimePoint retryAt_{};
   TimePoint handshakeEnds_{};
+  std::string place_;           // of the present or last connection
+  TimePoint samePlaceUntil_{};  // until then no other is tried
   std::chrono::milliseconds pause_;
   bool everConnected_ = false;
   SessionTable made_;                      // after all operations that were sent

@@ -19,9 +19,10 @@ constexpr std::size_t kMaxOpenBytes = std::size_t{4} << 20U;
 void ClientWorker::tryConnect() {
   // Watching comes first: a service that appears after the attempt is then noticed.
   watch_.begin();
-  auto connected = connectToService(options_.socketPath);
-  if (auto* bus = std::get_if<Bus>(&connected)) {
-    bus_ = std::move(*bus);
+  auto connected = connectToService(placesToTry());
+  if (auto* made = std::get_if<ConnectedBus>(&connected)) {
+    bus_ = std::move(made->bus);
+    place_ = std::move(made->place);
     state_ = State::kConnecting;
     handshakeEnds_ = std::chrono::steady_clock::now() + options_.requestTimeout;
     return;
@@ -32,6 +33,11 @@ void ClientWorker::tryConnect() {
   const MutexLock lock(mutex_);
   endNow_ = true;
   flushed_.notifyAll();
+}
+
+std::vector<std::string> ClientWorker::placesToTry() const {
+  if (std::chrono::steady_clock::now() < samePlaceUntil_) return {place_};
+  return places_;
 }
 
 void ClientWorker::processBus() {
@@ -54,6 +60,10 @@ void ClientWorker::processBus() {
 void ClientWorker::onReady() {
   state_ = State::kReady;
   watch_.end();
+  {
+    const MutexLock lock(mutex_);
+    shownPlace_ = place_;
+  }
   const auto operations = made_.remake();
   remaking_.assign(operations.begin(), operations.end());
   if (std::exchange(everConnected_, true)) reconnects_.fetch_add(1, std::memory_order_relaxed);
@@ -73,6 +83,7 @@ void ClientWorker::loseConnection() {
   openBytes_ = 0;
   remaking_.clear();
   const bool wasReady = state_ == State::kReady;
+  if (wasReady) samePlaceUntil_ = std::chrono::steady_clock::now() + options_.samePlaceFor;
   state_ = State::kAbsent;
   connected_.store(false, std::memory_order_relaxed);
   pauseBeforeRetry();

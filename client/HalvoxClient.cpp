@@ -1,9 +1,11 @@
 #include "client/HalvoxClient.h"
 
-#include <cstdlib>
+#include <filesystem>
+#include <system_error>
 #include <utility>
 
 #include "client/ClientWorker.h"
+#include "client/ServicePlaces.h"
 
 namespace halvox::client {
 
@@ -54,17 +56,15 @@ void HalvoxClient::setConnectionHandler(std::function<void(bool connected)> hand
   impl_->worker.setConnectionHandler(std::move(handler));
 }
 
+std::string HalvoxClient::socketPath() const { return impl_->worker.socketPath(); }
+
 std::string defaultSocketPath() {
-  constexpr const char* kBelowRuntimeDirectory = "/halvox/reporting.sock";
-  const auto variable = [](const char* name) {
-    const char* value = std::getenv(name);
-    return std::string(value != nullptr ? value : "");
-  };
-  if (auto path = variable("HALVOX_SOCKET"); !path.empty()) return path;
-  if (auto directory = variable("XDG_RUNTIME_DIR"); !directory.empty()) {
-    return directory + kBelowRuntimeDirectory;
+  const auto places = socketPlaces();
+  for (const std::string& place : places) {
+    std::error_code ignored;
+    if (std::filesystem::exists(place, ignored) || ignored) return place;
   }
-  return std::string("/run") + kBelowRuntimeDirectory;
+  return places.front();
 }
 
 }  // namespace halvox::client

@@ -43,7 +43,9 @@ struct Result {
 };
 
 struct Options {
-  // Where the service listens; empty: $HALVOX_SOCKET, else where the service's defaults put it.
+  // Where the service listens; empty: the first of the usual places that has a service. These are
+  // $HALVOX_SOCKET alone when it is set, else the user's, $XDG_RUNTIME_DIR/halvox/reporting.sock,
+  // then the system's, /run/halvox/reporting.sock.
   std::string socketPath;
   // What may wait for the client's thread: sends past either bound are dropped and counted.
   std::size_t maxPendingMessages = 8192;
@@ -53,6 +55,9 @@ struct Options {
   // First and longest pause between attempts to reach a service that is not there.
   std::chrono::milliseconds reconnectMin{50};
   std::chrono::milliseconds reconnectMax{2000};
+  // How long a client whose connection ended looks for a service at the same place only. A service
+  // that starts again must not lose its clients to another one meanwhile.
+  std::chrono::milliseconds samePlaceFor{10'000};
 };
 
 // What became of the messages that were handed over.
@@ -109,6 +114,8 @@ class HalvoxClient {
   // (false). False at once on the client's own thread, and when the client is being destroyed.
   bool flush(std::chrono::milliseconds timeout);
   [[nodiscard]] bool isConnected() const;
+  // The socket of the present or last connection; empty before the first one.
+  [[nodiscard]] std::string socketPath() const;
   [[nodiscard]] Counters counters() const;
   // Called on the client's thread whenever the connection is made (true) or lost (false), and soon
   // with true when it is made already. An empty one ends that, except for a call that is under way;
@@ -124,12 +131,18 @@ class HalvoxClient {
 // answer. Belongs to one thread. Does not reconnect.
 class HalvoxConnection {
  public:
-  // Connects to the socket (empty: as in Options) or says why it cannot.
+  // Connects to the socket (empty: as in Options) or says why it cannot, naming every place that
+  // was tried.
   static Result<std::unique_ptr<HalvoxConnection>> open(
-      std::string socketPath, std::chrono::milliseconds timeout = std::chrono::seconds(5));
+      const std::string& socketPath, std::chrono::milliseconds timeout = std::chrono::seconds(5));
   ~HalvoxConnection();
   HalvoxConnection(const HalvoxConnection&) = delete;
   HalvoxConnection& operator=(const HalvoxConnection&) = delete;
+
+  // The socket it is connected to.
+  [[nodiscard]] const std::string& socketPath() const;
+  // Sockets of places before that, which are there but which nobody serves.
+  [[nodiscard]] std::vector<std::string> unservedSockets() const;
 
   Result<bool> createReportingSession(ReporterID id);
   Result<bool> setServiceType(ServiceType type, ReporterID id);
@@ -155,8 +168,9 @@ class HalvoxConnection {
   std::unique_ptr<Impl> impl_;
 };
 
-// Where a service with default settings listens: $HALVOX_SOCKET, else
-// $XDG_RUNTIME_DIR/halvox/reporting.sock, else /run/halvox/reporting.sock.
+// Where a client with default settings looks for the service now: $HALVOX_SOCKET, else
+// $XDG_RUNTIME_DIR/halvox/reporting.sock if that exists, else /run/halvox/reporting.sock if that
+// exists, else the first of these that is set. Does not connect.
 std::string defaultSocketPath();
 
 }  // namespace halvox::client

@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <cerrno>
 #include <map>
 #include <utility>
 
@@ -83,10 +84,12 @@ int onHeldReply(sd_bus_message* answer, void* userData, sd_bus_error* /*error*/)
 
 class HalvoxConnection::Impl {
  public:
-  Impl(Bus bus, std::chrono::milliseconds timeout)
-      : bus_(std::move(bus)), timeout_(bounded(timeout)) {}
+  Impl(ConnectedBus connected, std::chrono::milliseconds timeout)
+      : connected_(std::move(connected)), timeout_(bounded(timeout)) {}
 
-  [[nodiscard]] sd_bus* bus() const { return bus_.get(); }
+  [[nodiscard]] sd_bus* bus() const { return connected_.bus.get(); }
+  [[nodiscard]] const std::string& place() const { return connected_.place; }
+  [[nodiscard]] const std::vector<TriedPlace>& passedOver() const { return connected_.passedOver; }
   [[nodiscard]] Deadline deadline() const { return std::chrono::steady_clock::now() + timeout_; }
 
   Result<BusMessage> ask(Request&& request) {
@@ -95,7 +98,7 @@ class HalvoxConnection::Impl {
     }
     BusError error;
     BusMessage answer;
-    const int result = sd_bus_call(bus_.get(), std::get<BusMessage>(request).get(),
+    const int result = sd_bus_call(bus(), std::get<BusMessage>(request).get(),
                                    toMicroseconds(timeout_), &error.raw, answer.out());
     if (result < 0) return failed<BusMessage>(failureFromCall(result, error.raw));
     return {std::move(answer), std::nullopt};
@@ -110,7 +113,7 @@ class HalvoxConnection::Impl {
   std::map<ReporterID, std::unique_ptr<HeldReply>>& heldReplies() { return heldReplies_; }
 
  private:
-  Bus bus_;
+  ConnectedBus connected_;
   std::chrono::milliseconds timeout_;
   std::map<ReporterID, std::unique_ptr<HeldReply>> heldReplies_;  // the slots go before the bus
 };
@@ -120,23 +123,32 @@ HalvoxConnection::HalvoxConnection(std::unique_ptr<Impl> impl) : impl_(std::move
 HalvoxConnection::~HalvoxConnection() = default;
 
 Result<std::unique_ptr<HalvoxConnection>> HalvoxConnection::open(
-    std::string socketPath, std::chrono::milliseconds timeout) {
+    const std::string& socketPath, std::chrono::milliseconds timeout) {
   using Opened = std::unique_ptr<HalvoxConnection>;
-  if (socketPath.empty()) socketPath = defaultSocketPath();
-  auto connected = connectToService(socketPath);
+  auto connected = connectToService(socketPlaces(socketPath));
   if (auto* failure = std::get_if<Failure>(&connected)) {
     return failed<Opened>(std::move(*failure));
   }
-  auto impl = std::make_unique<Impl>(std::move(std::get<Bus>(connected)), timeout);
+  auto impl = std::make_unique<Impl>(std::move(std::get<ConnectedBus>(connected)), timeout);
   const Deadline deadline = impl->deadline();
   while (sd_bus_is_ready(impl->bus()) <= 0) {
     if (const int result = processUntil(impl->bus(), deadline); result < 0) {
       return failed<Opened>(
           {result == -ETIMEDOUT ? Failure::Kind::kTimedOut : Failure::Kind::kNoService, "",
-           "no service answers at " + socketPath});
+           "the service at " + impl->place() + " does not answer"});
     }
   }
   return {Opened(new HalvoxConnection(std::move(impl))), std::nullopt};
+}
+
+const std::string& HalvoxConnection::socketPath() const { return impl_->place(); }
+
+std::vector<std::string> HalvoxConnection::unservedSockets() const {
+  std::vector<std::string> paths;
+  for (const TriedPlace& tried : impl_->passedOver()) {
+    if (tried.error == ECONNREFUSED) paths.push_back(tried.path);
+  }
+  return paths;
 }
 
 Result<bool> HalvoxConnection::createReportingSession(ReporterID id) {

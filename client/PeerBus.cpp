@@ -25,11 +25,6 @@ struct Overloaded : Cases... {
 template <typename... Cases>
 Overloaded(Cases...) -> Overloaded<Cases...>;
 
-Failure noService(const std::string& socketPath, int error) {
-  return {Failure::Kind::kNoService, "",
-          "no service at " + socketPath + ": " + std::string(strerror(error))};
-}
-
 Failure badRequest(std::string message) {
   return {Failure::Kind::kBadRequest, "", std::move(message)};
 }
@@ -38,7 +33,7 @@ Failure badRequest(int error) {
   return badRequest("the request has no form on the wire: " + std::string(strerror(error)));
 }
 
-// A non-blocking stream to that socket; negative errno in the second member when there is none.
+// A non-blocking stream to that socket; the system's error in the second member when there is none.
 std::pair<UniqueFd, int> connectSocket(const std::string& socketPath) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -52,6 +47,18 @@ std::pair<UniqueFd, int> connectSocket(const std::string& socketPath) {
     return {UniqueFd(), errno};
   }
   return {std::move(fd), 0};
+}
+
+// 0, or the error of the system.
+int startBus(UniqueFd fd, Bus& bus) {
+  int result = sd_bus_new(bus.out());
+  if (result < 0) return -result;
+  result = sd_bus_set_fd(bus.get(), fd.get(), fd.get());
+  if (result < 0) return -result;
+  static_cast<void>(fd.release());  // the bus owns it from here on
+  result = sd_bus_negotiate_fds(bus.get(), 0);
+  if (result >= 0) result = sd_bus_start(bus.get());
+  return result < 0 ? -result : 0;
 }
 
 Request finish(BusMessage message, int result) {
@@ -93,18 +100,17 @@ int appendRecipients(sd_bus_message* message, const Recipients& recipients) {
 
 }  // namespace
 
-std::variant<Bus, Failure> connectToService(const std::string& socketPath) {
-  auto [fd, error] = connectSocket(socketPath);
-  if (error != 0) return noService(socketPath, error);
-  Bus bus;
-  if (const int result = sd_bus_new(bus.out()); result < 0) return noService(socketPath, -result);
-  int result = sd_bus_set_fd(bus.get(), fd.get(), fd.get());
-  if (result < 0) return noService(socketPath, -result);
-  static_cast<void>(fd.release());  // the bus owns it from here on
-  result = sd_bus_negotiate_fds(bus.get(), 0);
-  if (result >= 0) result = sd_bus_start(bus.get());
-  if (result < 0) return noService(socketPath, -result);
-  return bus;
+std::variant<ConnectedBus, Failure> connectToService(const std::vector<std::string>& places) {
+  std::vector<TriedPlace> tried;
+  for (const std::string& place : places) {
+    auto [fd, error] = connectSocket(place);
+    Bus bus;
+    if (error == 0) error = startBus(std::move(fd), bus);
+    if (error == 0) return ConnectedBus{std::move(bus), place, std::move(tried)};
+    tried.push_back({place, error});
+    if (!meansAbsence(error)) break;
+  }
+  return Failure{Failure::Kind::kNoService, "", describeTried("service", tried)};
 }
 
 Request makeRequest(sd_bus* bus, const char* member) {

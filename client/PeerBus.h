@@ -11,6 +11,7 @@
 
 #include "client/HalvoxClient.h"
 #include "client/MessageRing.h"
+#include "client/ServicePlaces.h"
 #include "client/SessionTable.h"
 #include "platform/linux/UniqueHandle.h"
 
@@ -23,9 +24,18 @@ using BusMessage = platform::linux_::UniqueHandle<sd_bus_message*, sd_bus_messag
 // No time-out: the transport's own default would end calls that a busy service still answers.
 inline constexpr std::uint64_t kNoTimeout = UINT64_MAX;
 
-// Connects to the service's socket without waiting for the service; the handshake goes on in
-// sd_bus_process(). The bus belongs to the calling thread.
-std::variant<Bus, Failure> connectToService(const std::string& socketPath);
+// A connection, the place where it was made, and the places before that at which nothing was.
+struct ConnectedBus {
+  Bus bus;
+  std::string place;
+  std::vector<TriedPlace> passedOver;
+};
+
+// Connects to the first of the places, at least one, at which a service listens, without waiting
+// for it; the handshake goes on in sd_bus_process(). A place with a service that cannot be reached,
+// for whatever reason, ends the search. The failure names the places that were tried. The bus
+// belongs to the calling thread.
+std::variant<ConnectedBus, Failure> connectToService(const std::vector<std::string>& places);
 
 // A request that is ready to be sent, or why it cannot be put on the wire.
 using Request = std::variant<BusMessage, Failure>;

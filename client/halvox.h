@@ -195,7 +195,7 @@ HALVOX_API halvox_result halvox_array_append_array(halvox_array* array, const ha
  * fields that a later version adds are then defaults too. */
 typedef struct halvox_options {
   size_t size;
-  const char* socket_path;       /* NULL: halvox_default_socket_path() */
+  const char* socket_path;       /* NULL: the usual places, see below */
   uint64_t max_pending_messages; /* what may wait for the client's thread; 0: 8192 */
   uint64_t max_pending_bytes;    /* 0: 8 MiB */
   uint32_t request_timeout_ms;   /* how long making a connection may take; 0: 5000 */
@@ -218,9 +218,12 @@ typedef struct halvox_counters {
 /* Called on the client's thread. It must not call halvox_client_free(). */
 typedef void (*halvox_connection_handler)(bool connected, void* user_data);
 
-/* Where a service with default settings listens: $HALVOX_SOCKET, else
- * $XDG_RUNTIME_DIR/halvox/reporting.sock, else /run/halvox/reporting.sock. Fills the buffer as
- * halvox_category_name() does. */
+/* Where a client with default options looks for the service now: $HALVOX_SOCKET when it is set,
+ * else the user's place, $XDG_RUNTIME_DIR/halvox/reporting.sock, when that exists, else the
+ * system's, /run/halvox/reporting.sock, when that exists, else the first of these that is set. A
+ * client goes on to the next place when nobody serves a socket, and looks again at each attempt;
+ * one whose connection ended waits for 10 seconds at the same place before it looks elsewhere.
+ * Fills the buffer as halvox_category_name() does. */
 HALVOX_API size_t halvox_default_socket_path(char* buffer, size_t size);
 
 /* Starts a client, at once and whether there is a service or not. NULL for the options: all

@@ -154,16 +154,24 @@ std::string reasonOf(const CLI::ParseError& error, const CLI::App& app, const CL
 }
 
 // "halvoxctl send: --type: …": which command, which argument, what is wrong with it.
-std::string describe(const CLI::ParseError& error, const CLI::App& app, CommandSource source) {
-  const auto chosen = chosenOf(app);
+CommandLineText describe(const CLI::ParseError& error, const CLI::App& app, CommandSource source) {
+  auto chosen = chosenOf(app);
   const std::string prefix = nameOf(app, chosen);
+  const std::string reason = reasonOf(error, app, chosen.empty() ? app : *chosen.back());
   std::string text = prefix.empty() ? "" : prefix + ": ";
-  text += reasonOf(error, app, chosen.empty() ? app : *chosen.back()) + '\n';
+  text += reason + '\n';
   if (source == CommandSource::kArguments) text += "Try '" + prefix + " --help'.\n";
-  return text;
+  std::string command;
+  for (const CLI::App* part : chosen) command += (command.empty() ? "" : " ") + part->get_name();
+  return {ExitStatus::kBadArguments, std::move(text), std::move(command), reason};
 }
 
 }  // namespace
+
+bool asksForJson(const std::vector<std::string>& arguments) {
+  const auto end = std::ranges::find(arguments, "--");
+  return std::find(arguments.begin(), end, "--json") != end;
+}
 
 std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string> arguments,
                                                         CommandSource source, std::istream& input) {
@@ -189,7 +197,7 @@ std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string>
   } catch (const CLI::CallForVersion& version) {
     return CommandLineText{ExitStatus::kDone, std::string(version.what()) + "\n"};
   } catch (const CLI::ParseError& error) {
-    return CommandLineText{ExitStatus::kBadArguments, describe(error, app, source)};
+    return describe(error, app, source);
   }
   return commands.take();
 }

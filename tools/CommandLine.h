@@ -15,7 +15,13 @@ namespace halvox::tools {
 struct CommandLineText {
   ExitStatus status = ExitStatus::kDone;
   std::string text;
+  // Of what is wrong: the command, as far as it was given, and the reason alone.
+  std::string command{};
+  std::string reason{};
 };
+
+// Whether these arguments ask for JSON, even when they are wrong otherwise.
+bool asksForJson(const std::vector<std::string>& arguments);
 
 enum class CommandSource : std::uint8_t {
   kArguments,   // of the program

@@ -27,9 +27,10 @@ void CommandSet::addCommonOptions(CLI::App& app, CommandReach reach) {
   app.add_flag("--json", options_.json, "Print JSON, one object a line");
   if (source_ == CommandSource::kScriptLine) return;
   auto* socket = app.add_option("--socket", options_.socket,
-                                "The service's socket (default: $HALVOX_SOCKET, else "
-                                "$XDG_RUNTIME_DIR/halvox/reporting.sock, else "
-                                "/run/halvox/reporting.sock)")
+                                "The service's socket (default: $HALVOX_SOCKET, else what the "
+                                "configuration names, else the user's, "
+                                "$XDG_RUNTIME_DIR/halvox/reporting.sock, if a service is there, "
+                                "else the system's, /run/halvox/reporting.sock)")
                      ->type_name("PATH");
   auto* timeout = addParsed(app, "--timeout", options_.timeout, parseSeconds,
                             "How long to wait for an answer (default: 5)")

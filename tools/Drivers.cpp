@@ -184,7 +184,7 @@ std::string formatChannel(const IOReportChannel& channel, std::optional<double> 
 
 ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream& out,
                        int outputDescriptor, std::ostream& errors) {
-  const auto configuration = serviceConfiguration(Complaint("drivers", errors));
+  const auto configuration = serviceConfiguration(Complaint("drivers", form, out, errors));
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   // Lives as long as the process, because the sources' log remembers it.
   static ErrorLog errorLog;

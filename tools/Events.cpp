@@ -23,7 +23,7 @@ std::string formatEvent(const StoredEvent& event, OutputForm form) {
 ExitStatus showEvents(const RecordSelection& request, OutputForm form, std::ostream& out,
                       int outputDescriptor, std::ostream& errors) {
   const auto print = [&](const StoredEvent& event) { out << formatEvent(event, form) << '\n'; };
-  return runOverStore({"events", request, out, outputDescriptor, errors}, filterOf(request),
+  return runOverStore({"events", form, request, out, outputDescriptor, errors}, filterOf(request),
                       {[&](StoreReader& reader, const RecordFilter& filter) {
                          return reader.forEachEvent(filter, print);
                        },

@@ -18,8 +18,9 @@ namespace halvox::tools {
 using platform::linux_::Configuration;
 using platform::linux_::UniqueFd;
 
-ExitStatus postNotification(const PostNotification& request, std::ostream& errors) {
-  const Complaint complain("notify", errors);
+ExitStatus postNotification(const PostNotification& request, OutputForm form, std::ostream& out,
+                            std::ostream& errors) {
+  const Complaint complain("notify", form, out, errors);
   if (!platform::linux_::isUsableName(request.name)) {
     return complain(ExitStatus::kBadArguments,
                     "NAME: " + platform::linux_::shownName(request.name) +

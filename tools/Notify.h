@@ -14,6 +14,7 @@ struct PostNotification {
 
 // Posts a notification to the service: touches the file of that name in the directory where it
 // looks for them, which is made when it is missing. Does not need the service to run.
-ExitStatus postNotification(const PostNotification& request, std::ostream& errors);
+ExitStatus postNotification(const PostNotification& request, OutputForm form, std::ostream& out,
+                            std::ostream& errors);
 
 }  // namespace halvox::tools

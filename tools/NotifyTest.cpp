@@ -16,11 +16,13 @@ class NotifyTest : public testing::Test {
  protected:
   ExitStatus post(const std::string& name) {
     errors_.str("");
-    return postNotification({.name = name, .directory = directory_}, errors_);
+    return postNotification({.name = name, .directory = directory_}, OutputForm::kText, out_,
+                            errors_);
   }
 
   client::ScratchDirectory scratch_;
   std::string directory_ = scratch_.path("a/notify");
+  std::ostringstream out_;
   std::ostringstream errors_;
 };
 

@@ -100,7 +100,8 @@ ExitStatus unset(const Preferences& request, const std::filesystem::path& file,
 
 ExitStatus showOrChangePreferences(const Preferences& request, bool json, std::ostream& out,
                                    std::ostream& errors) {
-  const Complaint complain("preferences", errors);
+  const Complaint complain("preferences", json ? OutputForm::kJson : OutputForm::kText, out,
+                           errors);
   const auto found =
       settingsDirectory(request.directory, &Configuration::preferencesDirectory, complain);
   if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;

@@ -193,12 +193,13 @@ ExitStatus showRecords(const ShowRecords& request, OutputForm form, std::ostream
   const auto print = [&](const StoredRecord& record) {
     out << formatRecord(request.kind, record, form) << '\n';
   };
-  return runOverStore({commandOf(request.kind), request.selection, out, outputDescriptor, errors},
-                      filterOf(request),
-                      {[&](StoreReader& reader, const RecordFilter& filter) {
-                         return reader.forEachRecord(table, filter, print);
-                       },
-                       [&](EventFollower& follower) { return follower.deliver(table, print); }});
+  return runOverStore(
+      {commandOf(request.kind), form, request.selection, out, outputDescriptor, errors},
+      filterOf(request),
+      {[&](StoreReader& reader, const RecordFilter& filter) {
+         return reader.forEachRecord(table, filter, print);
+       },
+       [&](EventFollower& follower) { return follower.deliver(table, print); }});
 }
 
 }  // namespace halvox::tools

@@ -5,7 +5,9 @@
 #include <utility>
 
 #include "client/Vocabulary.h"
+#include "tools/Complaint.h"
 #include "tools/JsonText.h"
+#include "tools/ServiceConfiguration.h"
 
 namespace halvox::tools {
 namespace {
@@ -50,7 +52,7 @@ ExitStatus statusOf(Failure::Kind kind) {
 class RequestRunner::Execution {
  public:
   Execution(RequestRunner& runner, bool json, const std::string& prefix)
-      : connection_(*runner.connection_),
+      : connection_(runner.connection_),
         timeout_(runner.options_.timeout),
         out_(runner.out_),
         errors_(runner.errors_),
@@ -58,17 +60,17 @@ class RequestRunner::Execution {
         prefix_(prefix) {}
 
   ExitStatus operator()(const Create& request) {
-    return report("create", request.id, connection_.createReportingSession(request.id));
+    return report("create", request.id, connection_->createReportingSession(request.id));
   }
   ExitStatus operator()(const SetType& request) {
-    return report("set-type", request.id, connection_.setServiceType(request.type, request.id));
+    return report("set-type", request.id, connection_->setServiceType(request.type, request.id));
   }
   ExitStatus operator()(const Configure& request) {
     return report("configure", request.id,
-                  connection_.setConfiguration(request.configuration, request.id));
+                  connection_->setConfiguration(request.configuration, request.id));
   }
   ExitStatus operator()(const Start& request) {
-    const auto started = connection_.startReportingSessionForID(request.id);
+    const auto started = connection_->startReportingSessionForID(request.id);
     if (!started || !request.wait) return report("start", request.id, started);
     return reportWait("start", request.id, *request.wait);
   }
@@ -79,20 +81,20 @@ class RequestRunner::Execution {
   ExitStatus operator()(const Send& request) {
     return report(
         "send", std::nullopt,
-        connection_.sendMessage(request.message, request.category, request.type, request.ids));
+        connection_->sendMessage(request.message, request.category, request.type, request.ids));
   }
   ExitStatus operator()(const Stop& request) {
-    return report("stop", request.id, connection_.stopReportingSessionForID(request.id));
+    return report("stop", request.id, connection_->stopReportingSessionForID(request.id));
   }
   ExitStatus operator()(const Destroy& request) {
-    return report("destroy", request.id, connection_.destroyReportingSession(request.id));
+    return report("destroy", request.id, connection_->destroyReportingSession(request.id));
   }
   ExitStatus operator()(const Kill&) {
-    return report("kill", std::nullopt, connection_.killService());
+    return report("kill", std::nullopt, connection_->killService());
   }
 
   ExitStatus operator()(const GetType& request) {
-    const auto type = connection_.getServiceNameForReporterID(request.id);
+    const auto type = connection_->getServiceNameForReporterID(request.id);
     if (!type) return complain("type", *type.failure);
     const std::string name(client::serviceTypeName(*type.value));
     return print(name, {{"command", "type"},
@@ -102,7 +104,7 @@ class RequestRunner::Execution {
   }
 
   ExitStatus operator()(const Valid& request) {
-    const auto answer = connection_.reporterIDValid(request.id);
+    const auto answer = connection_->reporterIDValid(request.id);
     if (!answer) return complain("valid", *answer.failure);
     const Value* id = answer.value->find("reporterID");
     const Value* type = answer.value->find("serviceType");
@@ -120,7 +122,7 @@ class RequestRunner::Execution {
   }
 
   ExitStatus operator()(const List&) {
-    const auto ids = connection_.getAllReporters();
+    const auto ids = connection_->getAllReporters();
     if (!ids) return complain("list", *ids.failure);
     if (json_) {
       const std::vector<Value> values(ids.value->begin(), ids.value->end());
@@ -140,11 +142,7 @@ class RequestRunner::Execution {
     if (!failure.name.empty()) errors_ << " (" << harmlessText(failure.name) << ")";
     errors_ << '\n';
     if (json_) {
-      printJson({{"command", command},
-                 {"result", false},
-                 {"error", Dictionary{{"kind", nameOf(failure.kind)},
-                                      {"name", failure.name},
-                                      {"message", failure.message}}}});
+      out_ << failureJson(command, {nameOf(failure.kind), failure.name, failure.message}) << '\n';
     }
     return statusOf(failure.kind);
   }
@@ -164,18 +162,19 @@ class RequestRunner::Execution {
   // A request that says yes or no prints nothing when the answer was yes.
   ExitStatus report(const char* command, std::optional<ReporterID> id, const Result<bool>& result) {
     if (!result) return complain(command, *result.failure);
+    if (!*result.value) {
+      return complain(command, {Failure::Kind::kRefused, "", "the service said no"});
+    }
     Dictionary fields{{"command", command}};
     if (id) fields.set("id", *id);
-    fields.set("result", *result.value);
+    fields.set("result", true);
     if (json_) printJson(fields);
-    if (*result.value) return ExitStatus::kDone;
-    errors_ << prefix_ << command << ": the service said no\n";
-    return ExitStatus::kRefused;
+    return ExitStatus::kDone;
   }
 
   // That a start is not answered yet is no fault of the connection: the session just runs on.
   ExitStatus reportWait(const char* command, ReporterID id, std::chrono::milliseconds time) {
-    const auto answer = connection_.waitForStartReply(id, time);
+    const auto answer = connection_->waitForStartReply(id, time);
     if (answer || answer.failure->kind != Failure::Kind::kTimedOut) {
       return report(command, id, answer);
     }
@@ -184,7 +183,7 @@ class RequestRunner::Execution {
     return ExitStatus::kRefused;
   }
 
-  client::HalvoxConnection& connection_;
+  std::unique_ptr<client::HalvoxConnection>& connection_;  // of the runner
   std::chrono::milliseconds timeout_;
   std::ostream& out_;
   std::ostream& errors_;
@@ -193,15 +192,25 @@ class RequestRunner::Execution {
 };
 
 ExitStatus RequestRunner::run(const Request& request, bool json, const std::string& prefix) {
+  const char* command = std::visit([](const auto& asked) { return asked.kCommand; }, request);
   if (!connection_) {
-    auto opened = client::HalvoxConnection::open(options_.socket, options_.timeout);
-    if (!opened) {
-      errors_ << prefix << harmlessText(opened.failure->message) << '\n';
-      return statusOf(opened.failure->kind);
-    }
+    const Complaint complain(command, json ? OutputForm::kJson : OutputForm::kText, out_, errors_);
+    const auto socket = namedSocket(options_, complain);
+    if (const auto* status = std::get_if<ExitStatus>(&socket)) return *status;
+    auto opened = client::HalvoxConnection::open(std::get<std::string>(socket), options_.timeout);
+    if (!opened) return Execution(*this, json, prefix).complain(command, *opened.failure);
     connection_ = std::move(*opened.value);
+    sayWhatWasPassedOver();
   }
   return std::visit(Execution(*this, json, prefix), request);
+}
+
+// What answers may be another service than the user thinks.
+void RequestRunner::sayWhatWasPassedOver() {
+  for (const std::string& path : connection_->unservedSockets()) {
+    errors_ << "halvoxctl: nobody serves " << harmlessText(path) << "; using "
+            << harmlessText(connection_->socketPath()) << '\n';
+  }
 }
 
 }  // namespace halvox::tools

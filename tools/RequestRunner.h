@@ -18,11 +18,14 @@ class RequestRunner {
   RequestRunner(CommonOptions options, std::ostream& out, std::ostream& errors)
       : options_(std::move(options)), out_(out), errors_(errors) {}
 
-  // `prefix` begins each complaint: the program, and in a script the file and line.
+  // `prefix` begins each complaint, before the name of the command: the program, and in a script
+  // the file and line.
   ExitStatus run(const Request& request, bool json, const std::string& prefix);
 
  private:
   class Execution;
+
+  void sayWhatWasPassedOver();
 
   CommonOptions options_;
   std::ostream& out_;

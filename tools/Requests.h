@@ -7,7 +7,8 @@
 
 #include "client/HalvoxClient.h"
 
-// The requests to the service, as the arguments of halvoxctl or the line of a script say them.
+// The requests to the service, as the arguments of halvoxctl or the line of a script say them. Each
+// has the name of its command.
 namespace halvox::tools {
 
 using client::Category;
@@ -17,46 +18,61 @@ using client::ReporterID;
 using client::ServiceType;
 
 struct Create {
+  static constexpr const char* kCommand = "create";
   ReporterID id = 0;
 };
 struct SetType {
+  static constexpr const char* kCommand = "set-type";
   ReporterID id = 0;
   ServiceType type = 0;
 };
 struct GetType {
+  static constexpr const char* kCommand = "type";
   ReporterID id = 0;
 };
 struct Configure {
+  static constexpr const char* kCommand = "configure";
   ReporterID id = 0;
   Dictionary configuration;
 };
 struct Start {
+  static constexpr const char* kCommand = "start";
   ReporterID id = 0;
   std::optional<std::chrono::milliseconds> wait;  // for the answer, which comes at the stop
 };
 struct Send {
+  static constexpr const char* kCommand = "send";
   std::optional<std::vector<ReporterID>> ids;  // none: all active sessions
   Category category = 0;
   EventType type = 0;
   Dictionary message;
 };
 struct Stop {
+  static constexpr const char* kCommand = "stop";
   ReporterID id = 0;
 };
 struct Destroy {
+  static constexpr const char* kCommand = "destroy";
   ReporterID id = 0;
 };
 struct Valid {
+  static constexpr const char* kCommand = "valid";
   ReporterID id = 0;
 };
-struct List {};
-struct Kill {};
+struct List {
+  static constexpr const char* kCommand = "list";
+};
+struct Kill {
+  static constexpr const char* kCommand = "kill";
+};
 // In scripts only: what one connection can see that a single command cannot.
 struct WaitForStart {
+  static constexpr const char* kCommand = "wait";
   ReporterID id = 0;
   std::chrono::milliseconds timeout{};
 };
 struct Sleep {
+  static constexpr const char* kCommand = "sleep";
   std::chrono::milliseconds time{};
 };
 using Request = std::variant<Create, SetType, GetType, Configure, Start, Send, Stop, Destroy, Valid,

@@ -4,6 +4,7 @@
 #include <utility>
 
 #include "tools/CommandLine.h"
+#include "tools/Complaint.h"
 #include "tools/JsonText.h"
 #include "tools/RequestRunner.h"
 
@@ -84,6 +85,9 @@ ExitStatus runLine(const std::vector<std::string>& words, RequestRunner& runner,
   if (const auto* text = std::get_if<CommandLineText>(&parsed)) {
     const bool isHelp = text->status == ExitStatus::kDone;
     (isHelp ? out : errors) << (isHelp ? "" : prefix) << text->text;
+    if (!isHelp && (json || asksForJson(words))) {
+      out << failureJson(text->command, {failureKind(text->status), "", text->reason}) << '\n';
+    }
     return text->status;
   }
   const auto& command = std::get<Command>(parsed);
@@ -116,6 +120,10 @@ ExitStatus runScript(const ScriptSource& source, const CommonOptions& options, s
     auto words = splitLine(line);
     if (const auto* error = std::get_if<ArgumentError>(&words)) {
       errors << prefix << harmlessText(error->message) << '\n';
+      if (options.json) {
+        const auto kind = failureKind(ExitStatus::kBadArguments);
+        out << failureJson("", {kind, "", error->message}) << '\n';
+      }
       status = ExitStatus::kBadArguments;
     } else {
       auto& list = std::get<std::vector<std::string>>(words);

@@ -1,19 +1,83 @@
 #include "tools/ServiceConfiguration.h"
 
+#include <cerrno>
+#include <cstdlib>
 #include <system_error>
 #include <utility>
+#include <vector>
+
+#include <sys/stat.h>
+
+#include "client/ServicePlaces.h"
+#include "platform/linux/runtime/ConfigurationEnvironment.h"
 
 namespace halvox::tools {
+namespace {
 
 using platform::linux_::Configuration;
 using platform::linux_::ConfigurationError;
 
-std::variant<Configuration, ExitStatus> serviceConfiguration(const Complaint& complain) {
-  auto loaded = platform::linux_::loadConfiguration();
+constexpr const char* kDatabaseName = "halvox.db";
+
+bool isSocketInTheEnvironment() {
+  const char* value = std::getenv("HALVOX_SOCKET");
+  return value != nullptr && *value != '\0';
+}
+
+// The first of the usual places that has a store.
+struct StoreSearch {
+  std::filesystem::path directory;  // the user's when there is no store
+  bool isThere = false;
+  std::vector<client::TriedPlace> tried{};  // without success
+};
+
+StoreSearch searchStore() {
+  StoreSearch search{.directory = platform::linux_::userStorageDirectory()};
+  for (const auto& directory : {search.directory, platform::linux_::systemStorageDirectory()}) {
+    const auto database = directory / kDatabaseName;
+    struct stat status {};
+    // One that may not be looked at is there as far as anybody can tell.
+    if (::stat(database.c_str(), &status) == 0 || !client::meansAbsence(errno)) {
+      search.directory = directory;
+      search.isThere = true;
+      return search;
+    }
+    search.tried.push_back({database.native(), errno});
+  }
+  return search;
+}
+
+std::variant<Configuration, ExitStatus> configurationWith(const StoreSearch& search,
+                                                          const Complaint& complain) {
+  auto loaded =
+      platform::linux_::loadConfiguration({.socket = {}, .storageDirectory = search.directory});
   if (const auto* error = std::get_if<ConfigurationError>(&loaded)) {
     return complain(ExitStatus::kBadConfiguration, error->description);
   }
   return std::get<Configuration>(std::move(loaded));
+}
+
+}  // namespace
+
+std::variant<Configuration, ExitStatus> serviceConfiguration(const Complaint& complain) {
+  return configurationWith(searchStore(), complain);
+}
+
+std::variant<std::string, ExitStatus> namedSocket(const CommonOptions& options,
+                                                  const Complaint& complain) {
+  if (!options.socket.empty() || isSocketInTheEnvironment()) return options.socket;
+  const auto named = platform::linux_::configuredSocket();
+  if (const auto* path = std::get_if<std::filesystem::path>(&named)) return path->native();
+  return complain(ExitStatus::kBadConfiguration, std::get<ConfigurationError>(named).description);
+}
+
+std::variant<std::filesystem::path, ExitStatus> findStore(const Complaint& complain) {
+  const StoreSearch search = searchStore();
+  auto configuration = configurationWith(search, complain);
+  if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
+  auto& directory = std::get<Configuration>(configuration).storage.directory;
+  if (search.isThere || directory != search.directory) return std::move(directory);
+  return complain(ExitStatus::kNoService, client::describeTried("store", search.tried), "no-store");
 }
 
 std::variant<std::filesystem::path, ExitStatus> settingsDirectory(

@@ -50,9 +50,11 @@ std::variant<fs::path, ExitStatus> findSnapshot(const std::string& file,
     std::error_code error;
     const fs::directory_iterator opened(directory.path(), error);
     if (error && error != std::errc::no_such_file_or_directory) {
-      return complain(ExitStatus::kNoService, directory.path().native() + ": " + error.message());
+      return complain(ExitStatus::kNoService, directory.path().native() + ": " + error.message(),
+                      "no-store");
     }
-    return complain(ExitStatus::kNoService, "there is no snapshot in " + directory.path().native());
+    return complain(ExitStatus::kNoService, "there is no snapshot in " + directory.path().native(),
+                    "no-store");
   }
   return all.front();
 }
@@ -147,7 +149,7 @@ std::string stemOf(const fs::path& file) {
 
 ExitStatus showSnapshot(const ShowSnapshot& request, OutputForm form, std::ostream& out,
                         std::ostream& errors) {
-  const Complaint complain("snapshots show", errors);
+  const Complaint complain("snapshots show", form, out, errors);
   const auto found = findSnapshot(request.file, complain);
   if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
   const auto& file = std::get<fs::path>(found);
@@ -169,7 +171,7 @@ ExitStatus showSnapshot(const ShowSnapshot& request, OutputForm form, std::ostre
 
 ExitStatus extractSnapshot(const ExtractSnapshot& request, OutputForm form, std::ostream& out,
                            std::ostream& errors) {
-  const Complaint complain("snapshots extract", errors);
+  const Complaint complain("snapshots extract", form, out, errors);
   const auto found = findSnapshot(request.file, complain);
   if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
   const auto& file = std::get<fs::path>(found);

@@ -26,12 +26,8 @@ constexpr std::uint64_t kShownWhenFollowing = 10;
 // The directory of the store, or how the run ends without one.
 std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& run) {
   const std::string& database = run.selection.database;
-  const Complaint complain(run.command, run.errors);
-  if (database.empty()) {
-    const auto configuration = serviceConfiguration(complain);
-    if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
-    return std::get<platform::linux_::Configuration>(configuration).storage.directory;
-  }
+  const Complaint complain(run.command, run.form, run.out, run.errors);
+  if (database.empty()) return findStore(complain);
   const std::filesystem::path path(database);
   std::error_code ignored;
   if (std::filesystem::is_directory(path, ignored)) return path;
@@ -44,7 +40,8 @@ std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& r
 }
 
 ExitStatus cannotRead(const StoreRun& run, const StoreError& error) {
-  return Complaint(run.command, run.errors)(ExitStatus::kNoService, error.description);
+  return Complaint(run.command, run.form, run.out, run.errors)(ExitStatus::kNoService,
+                                                               error.description, "no-store");
 }
 
 // Waits for the next records. False when nobody reads the output any more.

@@ -26,6 +26,7 @@ struct RecordSelection {
 // What a command that shows stored records of one kind is run with.
 struct StoreRun {
   std::string command;  // for the complaints
+  OutputForm form;      // of the complaints
   const RecordSelection& selection;
   std::ostream& out;
   int outputDescriptor;  // what `out` writes to

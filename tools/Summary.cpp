@@ -156,7 +156,8 @@ ExitStatus showNewest(std::uint64_t count, OutputForm form, std::ostream& out,
   if (error || (files.empty() && count > 0)) {
     return complain(ExitStatus::kNoService,
                     directory.string() + ": " + (error ? error.message() : "has no summaries") +
-                        "; the service leaves them on internal builds only");
+                        "; the service leaves them on internal builds only",
+                    "no-store");
   }
   return showTable(files, form, out, complain);
 }
@@ -165,7 +166,7 @@ ExitStatus showNewest(std::uint64_t count, OutputForm form, std::ostream& out,
 
 ExitStatus showSummaries(const ShowSummaries& request, OutputForm form, std::ostream& out,
                          std::ostream& errors) {
-  const Complaint complain("summary", errors);
+  const Complaint complain("summary", form, out, errors);
   if (request.files.empty()) return showNewest(request.last, form, out, complain);
   if (request.files.size() == 1) return showOne(request.files.front(), form, out, complain);
   return showTable(request.files, form, out, complain);

@@ -144,7 +144,7 @@ std::string runProgram(std::vector<std::string> command) {
 
 ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options, std::ostream& out,
                        std::ostream& errors) {
-  const Complaint complain("trace record", errors);
+  const Complaint complain("trace record", options.form(), out, errors);
   const auto configuration = serviceConfiguration(complain);
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   const fs::path results =
@@ -154,8 +154,11 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
     return complain(ExitStatus::kBadArguments, params + ": " + std::strerror(errno));
   }
   const auto before = identityOf(results);
+  const auto socket = namedSocket(options, complain);
+  if (const auto* status = std::get_if<ExitStatus>(&socket)) return *status;
   auto opened = client::HalvoxConnection::open(
-      options.socket, std::max<std::chrono::milliseconds>(options.timeout, kStopWithin));
+      std::get<std::string>(socket),
+      std::max<std::chrono::milliseconds>(options.timeout, kStopWithin));
   if (!opened) return complain(ExitStatus::kNoService, opened.failure->message);
   TracedSession session(std::move(*opened.value));
   if (const std::string failure = session.start(params); !failure.empty()) {
@@ -177,7 +180,7 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
 
 ExitStatus showTrace(const ShowTrace& request, OutputForm form, std::ostream& out,
                      std::ostream& errors) {
-  const Complaint complain("trace show", errors);
+  const Complaint complain("trace show", form, out, errors);
   const auto read = readTraceResults(request.file);
   if (const auto* error = std::get_if<std::string>(&read)) {
     return complain(ExitStatus::kBadArguments, request.file + ": " + *error);
@@ -187,16 +190,17 @@ ExitStatus showTrace(const ShowTrace& request, OutputForm form, std::ostream& ou
   return ExitStatus::kDone;
 }
 
-ExitStatus exportTrace(const ExportTrace& request, std::ostream& errors) {
-  const Complaint complain("trace export", errors);
+ExitStatus exportTrace(const ExportTrace& request, OutputForm form, std::ostream& out,
+                       std::ostream& errors) {
+  const Complaint complain("trace export", form, out, errors);
   const auto read = readTraceResults(request.file);
   if (const auto* error = std::get_if<std::string>(&read)) {
     return complain(ExitStatus::kBadArguments, request.file + ": " + *error);
   }
-  std::ofstream out(request.to);
-  if (out) writeTraceEvents(std::get<TraceResults>(read), out);
-  out.close();
-  if (out) return ExitStatus::kDone;
+  std::ofstream file(request.to);
+  if (file) writeTraceEvents(std::get<TraceResults>(read), file);
+  file.close();
+  if (file) return ExitStatus::kDone;
   return complain(ExitStatus::kCannotWrite, request.to + ": " + std::strerror(errno));
 }
 

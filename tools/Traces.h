@@ -34,6 +34,7 @@ ExitStatus showTrace(const ShowTrace& request, OutputForm form, std::ostream& ou
 // Writes the intervals of a results file in the Trace Event form: a track for each measurement, on
 // which its intervals stand one behind the other, because results tell how long they took but not
 // when they were.
-ExitStatus exportTrace(const ExportTrace& request, std::ostream& errors);
+ExitStatus exportTrace(const ExportTrace& request, OutputForm form, std::ostream& out,
+                       std::ostream& errors);
 
 }  // namespace halvox::tools

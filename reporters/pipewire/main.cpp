@@ -1,12 +1,16 @@
 #include <chrono>
 #include <cstdio>
+#include <cstdlib>
 #include <exception>
+#include <filesystem>
 #include <string>
+#include <variant>
 
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
 
 #include "client/HalvoxClient.h"
+#include "platform/linux/runtime/Configuration.h"
 #include "reporters/pipewire/HalvoxReportingClient.h"
 #include "reporters/pipewire/MainLoop.h"
 #include "reporters/pipewire/PipeWireSource.h"
@@ -19,6 +23,7 @@ using namespace halvox::pipewire_reporter;  // NOLINT(google-build-using-namespa
 
 constexpr int kExitUsage = 2;
 constexpr int kExitSoftware = 70;
+constexpr int kExitConfiguration = 78;
 constexpr std::chrono::seconds kFarewell{1};
 
 struct Arguments {
@@ -31,7 +36,12 @@ struct Arguments {
 void logLine(std::string_view line) { fmt::print(stderr, "halvox-pipewire-reporter: {}\n", line); }
 
 void declareOptions(CLI::App& app, Arguments& arguments) {
-  app.add_option("--socket", arguments.socket, "The reporting service's socket")->type_name("PATH");
+  app.add_option(
+         "--socket", arguments.socket,
+         "The reporting service's socket (default: $HALVOX_SOCKET, else what the service's "
+         "configuration names, else the user's, $XDG_RUNTIME_DIR/halvox/reporting.sock, if a "
+         "service is there, else the system's, /run/halvox/reporting.sock)")
+      ->type_name("PATH");
   app.add_option("--remote", arguments.remote, "The PipeWire server to follow")->type_name("NAME");
   app.add_flag("--verbose", arguments.verbose, "Say each operation and message on standard error");
   app.add_flag("--no-xruns", arguments.noXruns,
@@ -49,6 +59,20 @@ void logLosses(const halvox::client::Counters& counters, const StreamTracker& tr
   }
 }
 
+// Names the service's socket where the arguments and the environment do not; false when the
+// configuration that would is wrong.
+bool completeFromConfiguration(Arguments& arguments) {
+  const char* variable = std::getenv("HALVOX_SOCKET");
+  if (!arguments.socket.empty() || (variable != nullptr && *variable != '\0')) return true;
+  const auto named = halvox::platform::linux_::configuredSocket();
+  if (const auto* path = std::get_if<std::filesystem::path>(&named)) {
+    arguments.socket = path->native();
+    return true;
+  }
+  logLine(std::get<halvox::platform::linux_::ConfigurationError>(named).description);
+  return false;
+}
+
 void run(const Arguments& arguments) {
   MainLoop loop;
   halvox::client::HalvoxClient client({.socketPath = arguments.socket});
@@ -56,8 +80,9 @@ void run(const Arguments& arguments) {
   VerboseReportingClient verbose(handOver, logLine);
   StreamTracker tracker(arguments.verbose ? static_cast<ReportingClient&>(verbose) : handOver);
   auto serviceRestarted = loop.makeNotifier([&tracker] { tracker.serviceRestarted(); });
-  client.setConnectionHandler([serviceRestarted, wasLost = false](bool connected) mutable {
-    logLine(connected ? "connected to the reporting service" : "the reporting service has gone");
+  client.setConnectionHandler([&client, serviceRestarted, wasLost = false](bool connected) mutable {
+    logLine(connected ? "connected to the reporting service at " + client.socketPath()
+                      : "the connection to the reporting service ended; waiting for it");
     if (connected && wasLost) {
       serviceRestarted();
     }
@@ -83,6 +108,7 @@ int main(int count, char** texts) {
   declareOptions(app, arguments);
   try {
     app.parse(count, texts);
+    if (!completeFromConfiguration(arguments)) return kExitConfiguration;
     run(arguments);
     return 0;
   } catch (const CLI::ParseError& error) {

@@ -31,7 +31,7 @@ using SharedArguments = std::shared_ptr<Arguments>;
 ExitStatus runRequest(const Request& request, const CommonOptions& options,
                       const ToolStreams& streams) {
   RequestRunner runner(options, streams.output, streams.errors);
-  return runner.run(request, options.json, "halvoxctl: ");
+  return runner.run(request, options.json, "halvoxctl ");
 }
 
 // `make` gives the request that `arguments` come to.

@@ -4,6 +4,7 @@
 #include <memory>
 
 #include "tools/Complaint.h"
+#include "tools/JsonText.h"
 #include "tools/Script.h"
 #include "tools/commands/Commands.h"
 
@@ -26,7 +27,7 @@ ExitStatus runFile(const RunScript& script, const CommonOptions& options,
   // A directory opens but cannot be read.
   if (file) (void)file.peek();
   if (file.bad() || !file.is_open()) {
-    return Complaint("run", streams.errors)(
+    return Complaint("run", options.form(), streams.output, streams.errors)(
         ExitStatus::kBadArguments,
         "FILE: cannot read " + script.file + ": " + std::strerror(errno));
   }

@@ -37,8 +37,9 @@ void addSelection(CLI::App& app, RecordSelection& selection, const char* records
                std::string("Go on showing ") + records +
                    " as they come; begins with the last 10 unless --since or --last say otherwise");
   app.add_option("--database", selection.database,
-                 "The store: a halvox.db or its directory (default: where the service's "
-                 "configuration puts it)")
+                 "The store: a halvox.db or its directory (default: what the configuration names, "
+                 "else the user's, $XDG_STATE_HOME/halvox or ~/.local/state/halvox, if there is "
+                 "one, else the system's, /var/lib/halvox)")
       ->type_name("FILE");
 }
 

@@ -71,8 +71,9 @@ void addNotify(CommandSet& commands) {
       ->type_name("DIRECTORY");
   commands.onRun(
       notify, [request] { return *request; },
-      [](const PostNotification& asked, const CommonOptions& /*options*/,
-         const ToolStreams& streams) { return postNotification(asked, streams.errors); });
+      [](const PostNotification& asked, const CommonOptions& options, const ToolStreams& streams) {
+        return postNotification(asked, options.form(), streams.output, streams.errors);
+      });
 }
 
 }  // namespace

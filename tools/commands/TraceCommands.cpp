@@ -51,8 +51,8 @@ void addExport(CommandSet& commands, CLI::App& trace) {
   exporting.add_option("--to", request->to, "The file to write")->type_name("FILE")->required();
   commands.onRun(
       exporting, [request] { return *request; },
-      [](const ExportTrace& asked, const CommonOptions& /*options*/, const ToolStreams& streams) {
-        return exportTrace(asked, streams.errors);
+      [](const ExportTrace& asked, const CommonOptions& options, const ToolStreams& streams) {
+        return exportTrace(asked, options.form(), streams.output, streams.errors);
       });
 }
 

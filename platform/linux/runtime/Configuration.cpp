@@ -210,7 +210,8 @@ void readDrivers(TableReader table, Configuration::Drivers& drivers) {
 }
 
 std::variant<Configuration, ConfigurationError> parse(const std::string& file,
-                                                      std::string_view text) {
+                                                      std::string_view text,
+                                                      const DefaultPlaces& places) {
   ConfigurationMistakes mistakes(file);
   if (const auto line = lineNestedTooDeep(text)) {
     mistakes.add(
@@ -226,7 +227,7 @@ std::variant<Configuration, ConfigurationError> parse(const std::string& file,
                  fmt::format("the file: expected TOML, found a mistake: {}", error.description()));
     return *mistakes.first();
   }
-  Configuration configuration = defaultConfiguration();
+  Configuration configuration = defaultConfiguration(places);
   TableReader root(&parsed.table(), "", mistakes);
   readListener(root.table("listener"), configuration.listener);
   readStorage(root.table("storage"), configuration.storage);
@@ -257,23 +258,38 @@ std::filesystem::path configurationPath() {
   return isMissing ? "/etc/halvox/halvox.toml" : own;
 }
 
-Configuration defaultConfiguration() {
+DefaultPlaces placesOfService() { return {defaultSocketPath(), defaultStorageDirectory()}; }
+
+Configuration defaultConfiguration(const DefaultPlaces& places) {
   Configuration configuration;
-  configuration.listener.socket = defaultSocketPath();
-  configuration.storage.directory = defaultStorageDirectory();
+  configuration.listener.socket = places.socket;
+  configuration.storage.directory = places.storageDirectory;
   configuration.storage.root = configuration.storage.directory / "root";
   setDefaultDirectories(configuration);
   return configuration;
 }
 
-std::variant<Configuration, ConfigurationError> loadConfiguration() {
+std::variant<Configuration, ConfigurationError> loadConfiguration(const DefaultPlaces& places) {
   const std::filesystem::path file = configurationPath();
   auto content = readText(file);
   if (auto* error = std::get_if<ConfigurationError>(&content)) return std::move(*error);
   const auto& text = std::get<std::optional<std::string>>(content);
-  if (text.has_value()) return parse(file.native(), *text);
+  if (text.has_value()) return parse(file.native(), *text, places);
   if (configurationVariable() != nullptr) return unreadable(file, ENOENT);
-  return defaultConfiguration();
+  return defaultConfiguration(places);
+}
+
+std::variant<std::filesystem::path, ConfigurationError> configuredSocket() {
+  // Without a socket of its own, so that one in the result is one that was named.
+  auto loaded = loadConfiguration({.socket = {}, .storageDirectory = defaultStorageDirectory()});
+  if (auto* configuration = std::get_if<Configuration>(&loaded)) {
+    return std::move(configuration->listener.socket);
+  }
+  auto& error = std::get<ConfigurationError>(loaded);
+  const bool isHidden =
+      error.kind == ConfigurationError::Kind::kUnreadable && configurationVariable() == nullptr;
+  if (isHidden) return std::filesystem::path();
+  return std::move(error);
 }
 
 }  // namespace halvox::platform::linux_

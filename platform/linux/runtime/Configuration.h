@@ -98,13 +98,27 @@ struct ConfigurationError {
 // (~/.config when unset), else /etc/halvox/halvox.toml.
 std::filesystem::path configurationPath();
 
-// The configuration of an absent file: all defaults, those of the environment included.
-Configuration defaultConfiguration();
+// Where things are of which the file says nothing.
+struct DefaultPlaces {
+  std::filesystem::path socket;
+  std::filesystem::path storageDirectory;
+};
 
-// Reads the configuration from the file that the environment names, with defaults from the
-// environment ($RUNTIME_DIRECTORY, $STATE_DIRECTORY, $XDG_...). A missing file means all defaults,
-// but a file that $HALVOX_CONFIG names must exist. Of several mistakes the first in the file is
-// told.
-std::variant<Configuration, ConfigurationError> loadConfiguration();
+// Where a service puts them, by its environment: $RUNTIME_DIRECTORY, $STATE_DIRECTORY, $XDG_...
+DefaultPlaces placesOfService();
+
+// The configuration of an absent file: all defaults.
+Configuration defaultConfiguration(const DefaultPlaces& places = placesOfService());
+
+// Reads the configuration from the file that the environment names. A missing file means all
+// defaults, but a file that $HALVOX_CONFIG names must exist. Of several mistakes the first in the
+// file is told.
+std::variant<Configuration, ConfigurationError> loadConfiguration(
+    const DefaultPlaces& places = placesOfService());
+
+// The socket that the configuration names, for programs that look for the service; empty when it
+// names none, and when the file is one that nobody named and that this user may not read, as the
+// system's may be.
+std::variant<std::filesystem::path, ConfigurationError> configuredSocket();
 
 }  // namespace halvox::platform::linux_

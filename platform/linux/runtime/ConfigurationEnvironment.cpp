@@ -44,8 +44,14 @@ std::filesystem::path defaultSocketPath() {
 
 std::filesystem::path defaultStorageDirectory() {
   if (auto directory = environmentPath("STATE_DIRECTORY")) return *directory;
+  return userStorageDirectory();
+}
+
+std::filesystem::path userStorageDirectory() {
   if (auto directory = environmentPath("XDG_STATE_HOME")) return *directory / "halvox";
   return homeDirectory() / ".local/state/halvox";
 }
+
+std::filesystem::path systemStorageDirectory() { return "/var/lib/halvox"; }
 
 }  // namespace halvox::platform::linux_

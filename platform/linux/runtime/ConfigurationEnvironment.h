@@ -19,7 +19,12 @@ std::filesystem::path homeDirectory();
 // holds a NUL.
 std::optional<std::filesystem::path> expandedPath(std::string_view text);
 
+// Where a service listens and stores of whom nothing else was said.
 std::filesystem::path defaultSocketPath();
 std::filesystem::path defaultStorageDirectory();
+
+// Where a user's service stores, and that of the system.
+std::filesystem::path userStorageDirectory();
+std::filesystem::path systemStorageDirectory();
 
 }  // namespace halvox::platform::linux_

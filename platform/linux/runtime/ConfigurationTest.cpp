@@ -63,6 +63,29 @@ TEST_F(ConfigurationTest, RelativeDirectoriesOfTheEnvironmentAreIgnored) {
   EXPECT_EQ(configuration.storage.directory, directory_ / ".local/state/halvox");
 }
 
+TEST_F(ConfigurationTest, ProgramsMayHaveOtherPlacesByDefault) {
+  ::setenv("HALVOX_CONFIG", write("").c_str(), 1);
+
+  const auto configuration =
+      std::get<Configuration>(loadConfiguration({.socket = {}, .storageDirectory = "/there"}));
+
+  EXPECT_EQ(configuration.listener.socket, "");
+  EXPECT_EQ(configuration.storage.directory, "/there");
+  EXPECT_EQ(configuration.notifyDirectory, "/there/notify");
+}
+
+TEST_F(ConfigurationTest, TheSocketIsToldToProgramsOnlyWhenItIsNamed) {
+  ::setenv("XDG_RUNTIME_DIR", "/run/user/7", 1);
+  ::setenv("HALVOX_CONFIG", write("").c_str(), 1);
+  EXPECT_EQ(std::get<std::filesystem::path>(configuredSocket()), "");
+
+  ::setenv("HALVOX_CONFIG", write("[listener]\nsocket = \"/named\"").c_str(), 1);
+  EXPECT_EQ(std::get<std::filesystem::path>(configuredSocket()), "/named");
+
+  ::setenv("HALVOX_CONFIG", write("[listener]\nsocket = 7").c_str(), 1);
+  EXPECT_TRUE(std::holds_alternative<ConfigurationError>(configuredSocket()));
+}
+
 TEST_F(ConfigurationTest, FileOfTheUserComesBeforeThatOfTheSystem) {
   EXPECT_EQ(configurationPath(), "/etc/halvox/halvox.toml");
 
