@@ -70,7 +70,7 @@ struct TLMReportingMessage {
 
 // The real-time reporting framework: forwards messages to the servers that collect them. Any thread
 // may call; one session is used by one thread at a time. Nothing here waits for a server: what
-// takes its time ends in a callback, on a thread of the framework.
+// takes its time ends in a callback, which must not wait either.
 class TLMReportingService {
  public:
   // The back-ends that were found, or none.
@@ -84,13 +84,15 @@ class TLMReportingService {
   virtual Token TLMHierarchyTokenCreate() = 0;
   virtual Session TLMReportingCreateSession(const Dictionary& sessionInfo,
                                             const Dictionary& userInfo) = 0;
-  // Begins to look for back-ends; the callback is called exactly once, later or before this
-  // returns. It must own what it uses.
+  // Begins to look for back-ends and returns. The callback is called exactly once, on a thread of
+  // the framework's own: never from inside this call or on the queue of a caller's job. It may come
+  // before this has returned, and also when nobody holds the session any more. It must own what it
+  // uses.
   virtual void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) = 0;
   virtual TLMReportingOutcome TLMReportingSendMessage(const Session& session,
                                                       const TLMReportingMessage& message) = 0;
   // Sends what the framework still holds for the session; `flushed` is called exactly once when
-  // that is done or given up.
+  // that is done or given up, which may be before this returns.
   virtual void TLMReportingFlushMessages(const Session& session, std::function<void()> flushed) = 0;
   // Sends one message outside any session.
   virtual TLMReportingOutcome TLMReportingSendOneMessage(const Dictionary& sessionInfo,

@@ -204,6 +204,7 @@ class HVReportingSession : public platform::KQTraceSessionDelegate,
 
   // The link; but for the submitting functions, jobs of its queue and callbacks.
   struct LinkStart;
+  class LinkDiscovery;
   struct LinkMessage {
     platform::Message original{};  // as the client gave it
     platform::Dictionary tagged{};

@@ -1,3 +1,4 @@
+#include <atomic>
 #include <chrono>
 #include <string>
 #include <utility>
@@ -22,6 +23,7 @@ using platform::Value;
 using platform::WaitOutcome;
 
 constexpr std::string_view kQueueLabel = "com.tarno.halvox.session.tlmreporting";
+constexpr std::string_view kDiscoveryQueueLabel = "com.tarno.halvox.session.discovery";
 constexpr std::chrono::seconds kBackendTimeOut{9};
 // What a waiting message costs beside its content, about: the job and its place in the queue.
 constexpr std::size_t kWaitingOverhead = 256;
@@ -87,6 +89,49 @@ struct HVReportingSession::LinkStart {
   }
 };
 
+// What the framework answers about back-ends, on its way to one start of a session's link. The
+// framework may answer while the start job has not yet logged that it waits. Then the answer stays
+// here until it has, and goes on from a queue of its own: so the log of a link always reads in the
+// order in which one thing follows from another, and neither thread waits for the other.
+//
+//   await(), then answer(): reported on the framework's thread
+//   answer(), then await(): reported by a job of a queue of its own
+//
+// Shared by the start job and the framework's callback. The framework may call back late or never,
+// so this does not hold the session. One that is gone has nobody waiting: then only the log is
+// told.
+class HVReportingSession::LinkDiscovery {
+ public:
+  using Backends = std::optional<platform::Array>;
+
+  explicit LinkDiscovery(std::weak_ptr<HVReportingSession> session)
+      : session_(std::move(session)) {}
+
+  // The start job has logged that it waits. Once, on the session's queue.
+  void await() {
+    if (!isSecond()) return;
+    platform::dispatch()
+        .createSerialQueue(kDiscoveryQueueLabel, platform::QualityOfService::kUtility,
+                           platform::QueueThreading::kShared)
+        ->async(JobWeight::kBrief, [session = session_, backends = std::move(answered_)] {
+          onBackendsFound(session, backends);
+        });
+  }
+  // Once, on the framework's thread.
+  void answer(const Backends& backends) {
+    answered_ = backends;
+    if (isSecond()) onBackendsFound(session_, backends);
+  }
+
+ private:
+  bool isSecond() { return hasFirst_.exchange(true, std::memory_order_acq_rel); }
+
+  const std::weak_ptr<HVReportingSession> session_;
+  Backends answered_;  // the start job's when that is the second
+  // Whether one of the two was here. Orders the answer before its use by the start job.
+  std::atomic<bool> hasFirst_{false};
+};
+
 const std::shared_ptr<platform::DispatchQueue>& HVReportingSession::tlmReportingQueue() {
   std::call_once(tlmReportingQueueMade_, [this] {
     tlmReportingQueue_ = platform::dispatch().createSerialQueue(
@@ -122,19 +167,17 @@ void HVReportingSession::startLink(const LinkStart& start) {
   const auto opened =
       framework.TLMReportingCreateSession(start.sessionInfo(reporterID_, *token), start.userInfo());
   tlmReportingSession_.set(opened);
-  // The framework may call back late or never, so the callback does not hold the session. A session
-  // that is gone has nobody waiting: then the callback only tells the log.
+  const auto discovery = std::make_shared<LinkDiscovery>(weak_from_this());
   framework.TLMReportingStartConfiguration(
-      opened, [session = weak_from_this()](const std::optional<platform::Array>& backends) {
-        onBackendsFound(session, backends);
-      });
+      opened, [discovery](const auto& backends) { discovery->answer(backends); });
   kLinkLog.notice("waiting to find backends");
+  discovery->await();
   tlmReportingQueue()->waitOn(
       tlmreportingBackendSemaphore(), kBackendTimeOut,
       [session = shared_from_this()](WaitOutcome outcome) { session->endLinkStart(outcome); });
 }
 
-// On the framework's thread.
+// Never on the session's queue.
 void HVReportingSession::onBackendsFound(const std::weak_ptr<HVReportingSession>& weakSession,
                                          const std::optional<platform::Array>& backends) {
   if (backends.has_value()) {

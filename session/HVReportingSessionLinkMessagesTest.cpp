@@ -162,7 +162,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, BeforeTheStartAMessageIsASingleOne) {
 // Whether it was started counts when it is sent, not when its job runs.
 TEST_F(HVReportingSessionLinkMessagesTest,
        AMessageOfAStartedSessionIsNoSingleOneThoughTheStopOvertakes) {
-  framework_.answerDiscoveries(Fake::Answering::kBeforeReturning, kServers);
+  framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
   session_->start();
   send({{"a", 1}});
   session_->stop();
@@ -383,7 +383,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, ASessionCanBeStartedAgainWithANewFram
 TEST_F(HVReportingSessionLinkMessagesTest, ASessionThatWaitsDelaysNoOther) {
   holdDiscoveries();
   start();
-  framework_.answerDiscoveries(Fake::Answering::kBeforeReturning, kServers);
+  framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
   const auto other =
       std::make_shared<HVReportingSession>(ReporterID{8}, HVReportingSession::ProcessIdentifiers{});
   other->setTlmReportingEnabled(true);

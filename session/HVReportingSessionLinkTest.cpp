@@ -154,11 +154,30 @@ TEST_F(HVReportingSessionLinkTest, BackendsThatAreFoundOpenTheLink) {
   EXPECT_TRUE(session_->tlmReportingSessionStarted());
 }
 
-TEST_F(HVReportingSessionLinkTest, BackendsMayBeFoundBeforeTheDiscoveryReturns) {
+TEST_F(HVReportingSessionLinkTest, BackendsAreListedAfterTheWaitForThem) {
   open();
 
-  EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kList, kWaiting, kContinuing));
+  EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kList, kContinuing));
   EXPECT_TRUE(session_->tlmReportingSessionStarted());
+}
+
+// The framework's thread may be faster than the job that asked it.
+TEST_F(HVReportingSessionLinkTest, BackendsFoundBeforeTheDiscoveryReturnsAreListedAfterTheWaitToo) {
+  framework_.answerDiscoveries(Fake::Answering::kBeforeReturning, kServers);
+
+  start();
+
+  EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kList, kContinuing));
+  EXPECT_TRUE(session_->tlmReportingSessionStarted());
+}
+
+TEST_F(HVReportingSessionLinkTest, NoBackendsBeforeTheDiscoveryReturnsAreToldAfterTheWaitToo) {
+  framework_.answerDiscoveries(Fake::Answering::kBeforeReturning);
+
+  start();
+
+  EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kNone, kFailed));
+  EXPECT_TRUE(holdsNothing());
 }
 
 TEST_F(HVReportingSessionLinkTest, AnEmptyListIsAListAllTheSame) {

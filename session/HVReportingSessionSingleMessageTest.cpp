@@ -194,6 +194,7 @@ TEST_F(HVReportingSessionSingleMessageTest, AFailureWithoutAnErrorIsSilentAndRep
 }
 
 TEST_F(HVReportingSessionSingleMessageTest, AnyNumberMayWaitAndAllGoOut) {
+  platform_.log.setLevel(LogLevel::kError);
   const Dictionary large{{"a", std::string(1024 * 1024, 'x')}};
 
   for (int round = 0; round < 100; ++round) send(AudioServiceType::kHaptics, large);

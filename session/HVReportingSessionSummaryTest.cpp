@@ -188,8 +188,8 @@ TEST_F(HVReportingSessionSummaryTest, VolumesOfHalfASecondAreNotReported) {
 TEST_F(HVReportingSessionSummaryTest, TheLinkGetsVolumeMessagesThenTheSummaryThenTheFlush) {
   session_->stop();
   session_->setTlmReportingEnabled(true);
-  platform_.tlmReporting.answerDiscoveries(
-      platform::FakeTlmReportingService::Answering::kBeforeReturning, platform::Array{"server"});
+  platform_.tlmReporting.answerDiscoveries(platform::FakeTlmReportingService::Answering::kLater,
+                                           platform::Array{"server"});
   session_->start();
   playTwoVolumes();
   platform_.dispatch.runUntilIdle();
@@ -208,8 +208,8 @@ TEST_F(HVReportingSessionSummaryTest, TheLinkGetsVolumeMessagesThenTheSummaryThe
 TEST_F(HVReportingSessionSummaryTest, TheSummaryHasAllBitsOfItsCategoryAndTypeSet) {
   session_->stop();
   session_->setTlmReportingEnabled(true);
-  platform_.tlmReporting.answerDiscoveries(
-      platform::FakeTlmReportingService::Answering::kBeforeReturning, platform::Array{"server"});
+  platform_.tlmReporting.answerDiscoveries(platform::FakeTlmReportingService::Answering::kLater,
+                                           platform::Array{"server"});
   session_->start();
   send({{"foo", 1}});
 
@@ -238,8 +238,8 @@ TEST_F(HVReportingSessionSummaryTest, VolumesThatNeverPlayedSendNoVolumeEvent) {
 TEST_F(HVReportingSessionSummaryTest, TheSummaryCoversTheVolumeMessages) {
   session_->setTlmReportingEnabled(true);
   playTwoVolumes();
-  platform_.tlmReporting.answerDiscoveries(
-      platform::FakeTlmReportingService::Answering::kBeforeReturning, platform::Array{"server"});
+  platform_.tlmReporting.answerDiscoveries(platform::FakeTlmReportingService::Answering::kLater,
+                                           platform::Array{"server"});
   session_->stop();
   session_->start();
   playTwoVolumes();

@@ -62,7 +62,7 @@ class LinkTest : public testing::Test {
   // From now on discoveries wait for the test.
   void holdDiscoveries() { framework_.answerDiscoveries(Fake::Answering::kWhenTold); }
   void open() {
-    framework_.answerDiscoveries(Fake::Answering::kBeforeReturning, kServers);
+    framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
     start();
   }
   void send(const Dictionary& message, AudioEventCategory category = kPlayback,

@@ -55,13 +55,13 @@ struct FakePlatform {
   FakeNotifyService notify;
   FakePowerLogService powerLog{journal};
   FakePreferenceService preferences;
-  FakeTlmReportingService tlmReporting{journal};
   FakeIOReportService ioReport{journal};
   FakeKtraceService ktrace{journal};
   FakePerformanceTraceService performanceTraces{journal};
   FakePropertyListService propertyLists;
   FakeResultsFileService resultsFiles{journal};
   FakeDispatchService dispatch{clock};
+  FakeTlmReportingService tlmReporting{journal, dispatch};
   FakeConnectionService connections{journal};
 };
 

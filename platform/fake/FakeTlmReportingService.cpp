@@ -1,6 +1,8 @@
 #include "platform/fake/FakeTlmReportingService.h"
 
 #include <algorithm>
+#include <memory>
+#include <thread>
 #include <utility>
 
 namespace halvox::platform {
@@ -141,16 +143,32 @@ TLMReportingService::Session FakeTlmReportingService::TLMReportingCreateSession(
 void FakeTlmReportingService::TLMReportingStartConfiguration(const Session& session,
                                                              BackendsCallback found) {
   journal_.record(JournalKind::kLink, "configure " + session->description());
+  Answering answering{};
   std::optional<Array> backends;
   {
     const std::lock_guard lock(mutex_);
-    if (discoveries_ == Answering::kWhenTold) {
+    answering = discoveries_;
+    backends = backends_;
+    if (answering == Answering::kWhenTold) {
       waitingDiscoveries_.push_back(std::move(found));
       return;
     }
-    backends = backends_;
   }
-  found(backends);
+  answer(answering, std::move(found), backends);
+}
+
+void FakeTlmReportingService::answer(Answering answering, BackendsCallback found,
+                                     const std::optional<Array>& backends) {
+  if (answering == Answering::kBeforeReturning) {
+    std::thread([&] { found(backends); }).join();
+    return;
+  }
+  // A queue that only the framework knows stands for its thread.
+  const auto thread = std::make_shared<FakeDispatchQueue>(
+      dispatch_, FakeDispatchQueue::Traits{.label = "real-time framework",
+                                           .quality = QualityOfService::kUtility,
+                                           .threading = QueueThreading::kShared});
+  thread->async(JobWeight::kBrief, [found = std::move(found), backends] { found(backends); });
 }
 
 TLMReportingOutcome FakeTlmReportingService::TLMReportingSendMessage(

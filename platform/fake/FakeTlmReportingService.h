@@ -9,17 +9,23 @@
 #include <string>
 #include <vector>
 
+#include "platform/fake/FakeDispatchService.h"
 #include "platform/fake/Journal.h"
 #include "platform/tlm_reporting.h"
 
 namespace halvox::platform {
 
 // A real-time framework without servers: it keeps what it was given, and the test says how it
-// answers. At first every discovery finds none and every flush is done before the call returns, and
-// every message is sent. Any thread may call; the test steers and reads from its own.
+// answers. At first every discovery finds none, which is told when the test pumps the dispatch
+// service, every flush is done before the call returns, and every message is sent. Any thread may
+// call; the test steers and reads from its own.
 class FakeTlmReportingService final : public TLMReportingService {
  public:
-  enum class Answering : unsigned char { kBeforeReturning, kWhenTold };
+  enum class Answering : unsigned char {
+    kLater,            // as a job of its own when the test pumps the dispatch service
+    kBeforeReturning,  // a discovery on another thread, a flush on this one
+    kWhenTold,
+  };
 
   // One message, with what its session or, outside any session, its call said of it.
   struct SentMessage {
@@ -33,13 +39,16 @@ class FakeTlmReportingService final : public TLMReportingService {
     Dictionary userInfo;
   };
 
-  // Does not own the journal, which must outlive it.
-  explicit FakeTlmReportingService(Journal& journal) : journal_(journal) {}
+  // Owns neither; the journal must outlive it, and the dispatch service must be there whenever it
+  // answers later.
+  FakeTlmReportingService(Journal& journal, FakeDispatchService& dispatch)
+      : journal_(journal), dispatch_(dispatch) {}
 
-  // From now on discoveries are answered so; `backends` counts only before returning.
+  // From now on discoveries are answered so; `backends` counts unless the test tells each answer.
   void answerDiscoveries(Answering answering, std::optional<Array> backends = std::nullopt);
   // Answers the discovery that has waited longest, on this thread; false when none waits.
   bool answerDiscovery(const std::optional<Array>& backends);
+  // kLater is not for flushes.
   void answerFlushes(Answering answering);
   // Ends the flush that has waited longest, on this thread; false when none waits.
   bool completeFlush();
@@ -74,9 +83,12 @@ class FakeTlmReportingService final : public TLMReportingService {
                                                  const TLMReportingMessage& message) override;
 
  private:
+  void answer(Answering answering, BackendsCallback found, const std::optional<Array>& backends);
+
   Journal& journal_;
+  FakeDispatchService& dispatch_;
   mutable std::mutex mutex_;
-  Answering discoveries_ = Answering::kBeforeReturning;
+  Answering discoveries_ = Answering::kLater;
   Answering flushes_ = Answering::kBeforeReturning;
   std::optional<Array> backends_;
   TLMReportingOutcome outcome_{.sent = true};

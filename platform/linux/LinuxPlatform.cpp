@@ -219,6 +219,7 @@ bool LinuxPlatform::close() {
   traces_->stop();
   const bool ended = dispatch_.stop(kJobsEndWithin);
   ended ? traces_->close() : traces_->abandon();
+  linkCallbacks_.stop();
   const bool linkEnded = !nats_ || nats_->close();
   store_.close();
   logStatistics(LogLevel::kInfo, Counters::kCounted);

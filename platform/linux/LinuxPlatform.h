@@ -9,6 +9,7 @@
 #include "platform/linux/diagnostics/SnapshotDiagnosticReporterService.h"
 #include "platform/linux/drivers/LinuxIOReportService.h"
 #include "platform/linux/files/RootedFileService.h"
+#include "platform/linux/link/local/CallbackThread.h"
 #include "platform/linux/link/local/LocalTlmReportingService.h"
 #include "platform/linux/link/local/NoneTlmReportingService.h"
 #include "platform/linux/link/nats/NatsTlmReporting.h"
@@ -91,8 +92,10 @@ class LinuxPlatform {
   InotifyNotifyService notify_;
   SqlitePowerLogService powerLog_{store_, clock_};
   TomlPreferenceService preferences_;
-  LocalTlmReportingService localLink_{store_, clock_};
-  NoneTlmReportingService noLink_{statistics_};
+  // Uses the queues, which come later; close() ends it while they are still there.
+  CallbackThread linkCallbacks_{dispatch_};
+  LocalTlmReportingService localLink_{store_, clock_, linkCallbacks_};
+  NoneTlmReportingService noLink_{statistics_, linkCallbacks_};
   LinuxIOReportService ioReport_;
   PlistPropertyListService propertyLists_;
   JsonResultsFileService resultsFiles_;

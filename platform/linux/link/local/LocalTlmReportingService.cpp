@@ -64,7 +64,7 @@ TLMReportingService::Session LocalTlmReportingService::TLMReportingCreateSession
 
 void LocalTlmReportingService::TLMReportingStartConfiguration(const Session& /*session*/,
                                                               BackendsCallback found) {
-  found(Array{kBackendName});
+  callbacks_.call([found = std::move(found)] { found(Array{kBackendName}); });
 }
 
 TLMReportingOutcome LocalTlmReportingService::TLMReportingSendMessage(

@@ -4,6 +4,7 @@
 #include <cstdint>
 
 #include "platform/clock.h"
+#include "platform/linux/link/local/CallbackThread.h"
 #include "platform/linux/store/SqliteStore.h"
 #include "platform/tlm_reporting.h"
 
@@ -11,16 +12,17 @@ namespace halvox::platform::linux_ {
 
 // The real-time reporting framework of a machine on its own: every message becomes a record of the
 // store, under the time of the call, in the order of the calls. There is one back-end, called
-// "local", and it is always found, before the call that asks for it returns.
+// "local", and it is always found.
 //
 // A message that was sent is with the store's writer, which has it in the database within half a
 // second whoever ends its session meanwhile; so a flush is done at once. What the store then
 // cannot keep, it counts. Any thread may call; calls wait while the store has no room. Does not own
-// the store and the clock, which must outlive it and its sessions.
+// what it is made with, which must outlive it and its sessions.
 class LocalTlmReportingService final : public TLMReportingService {
  public:
-  LocalTlmReportingService(SqliteStore& store, const ClockService& clock)
-      : records_(store.linkMessages()), clock_(clock) {}
+  // Answers discoveries on that thread.
+  LocalTlmReportingService(SqliteStore& store, const ClockService& clock, CallbackThread& callbacks)
+      : records_(store.linkMessages()), clock_(clock), callbacks_(callbacks) {}
 
   Token TLMHierarchyTokenCreate() override;
   Session TLMReportingCreateSession(const Dictionary& sessionInfo,
@@ -42,6 +44,7 @@ class LocalTlmReportingService final : public TLMReportingService {
 
   LinkMessageRecords& records_;
   const ClockService& clock_;
+  CallbackThread& callbacks_;
   std::atomic<std::uint64_t> lastToken_{0};  // orders with nothing: only unlike the others
 };
 

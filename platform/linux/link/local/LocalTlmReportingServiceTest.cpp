@@ -17,7 +17,7 @@ class LocalTlmReportingServiceTest : public StoreTest {
 
   void startLink() {
     start();
-    link = std::make_unique<LocalTlmReportingService>(*store, platform.clock);
+    link = std::make_unique<LocalTlmReportingService>(*store, platform.clock, callbacks);
   }
   static Dictionary sessionInfo(std::int64_t sessionID) {
     return {{kTLMReportingSessionInfoSessionID, sessionID}};
@@ -30,6 +30,7 @@ class LocalTlmReportingServiceTest : public StoreTest {
     return rows(database(), "SELECT " + columns + " FROM link_messages");
   }
 
+  CallbackThread callbacks{platform.dispatch};
   std::unique_ptr<LocalTlmReportingService> link;
 };
 
@@ -40,6 +41,7 @@ TEST_F(LocalTlmReportingServiceTest, FindsTheOneBackendOnce) {
   link->TLMReportingStartConfiguration(
       link->TLMReportingCreateSession(sessionInfo(7), {}),
       [&](const std::optional<Array>& backends) { found.push_back(backends); });
+  callbacks.stop();  // waits for the answer
 
   ASSERT_EQ(found.size(), 1U);
   EXPECT_EQ(Value(found.front().value_or(Array{})), Value(Array{"local"}));

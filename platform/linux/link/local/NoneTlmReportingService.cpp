@@ -1,5 +1,8 @@
 #include "platform/linux/link/local/NoneTlmReportingService.h"
 
+#include <string>
+#include <utility>
+
 namespace halvox::platform::linux_ {
 namespace {
 
@@ -11,7 +14,8 @@ class NoneSession final : public TLMReportingSession {
 }  // namespace
 
 TLMReportingService::Token NoneTlmReportingService::TLMHierarchyTokenCreate() {
-  return std::make_shared<TLMSecureHierarchyToken>("none");
+  const std::uint64_t number = lastToken_.fetch_add(1, std::memory_order_relaxed) + 1;
+  return std::make_shared<TLMSecureHierarchyToken>("none-" + std::to_string(number));
 }
 
 TLMReportingService::Session NoneTlmReportingService::TLMReportingCreateSession(
@@ -21,7 +25,7 @@ TLMReportingService::Session NoneTlmReportingService::TLMReportingCreateSession(
 
 void NoneTlmReportingService::TLMReportingStartConfiguration(const Session& /*session*/,
                                                              BackendsCallback found) {
-  found(std::nullopt);
+  callbacks_.call([found = std::move(found)] { found(std::nullopt); });
 }
 
 TLMReportingOutcome NoneTlmReportingService::TLMReportingSendMessage(

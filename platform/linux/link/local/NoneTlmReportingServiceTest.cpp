@@ -9,7 +9,8 @@ namespace {
 
 struct NoneTlmReportingServiceTest : ::testing::Test {
   FakePlatform platform;
-  NoneTlmReportingService service{platform.statistics};
+  CallbackThread callbacks{platform.dispatch};
+  NoneTlmReportingService service{platform.statistics, callbacks};
 };
 
 TEST_F(NoneTlmReportingServiceTest, FindsNoBackend) {
@@ -21,6 +22,7 @@ TEST_F(NoneTlmReportingServiceTest, FindsNoBackend) {
                                            ++calls;
                                            found = backends;
                                          });
+  callbacks.stop();  // waits for the answer
 
   EXPECT_EQ(calls, 1);
   EXPECT_FALSE(found.has_value());

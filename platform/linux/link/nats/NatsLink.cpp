@@ -38,24 +38,25 @@ NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environme
 
 NatsLink::~NatsLink() { (void)close(); }
 
-void NatsLink::discover(const TLMReportingService::BackendsCallback& found) {
-  std::optional<Array> servers;
+void NatsLink::discover(TLMReportingService::BackendsCallback found) {
   std::uint64_t waiter = 0;
   std::string failure;
   {
     const MutexLock lock(mutex_);
     const bool isRefused = closeBy_.has_value();
     if (!isRefused) failure = provideThread();
-    if (!isRefused && isConnected_) {
-      servers = servers_;
-    } else if (!isRefused && failure.empty()) {
+    if (!isRefused && failure.empty()) {
       waiter = ++lastWaiter_;
-      waiters_.push_back({waiter, found});
+      waiters_.push_back({waiter, std::move(found)});
       wakeThread();
     }
   }
   if (!failure.empty()) kLog.error("no server of the link is looked for: ", failure);
-  if (waiter == 0) return found(servers);
+  if (waiter == 0) {
+    // Without the thread that answers, the background queue does.
+    return dispatch_.asyncAfterOnBackgroundQueue(
+        std::chrono::nanoseconds(0), [found = std::move(found)] { found(std::nullopt); });
+  }
   dispatch_.asyncAfterOnBackgroundQueue(kDiscoveryTime, [link = weak_from_this(), waiter] {
     if (const auto self = link.lock()) self->expire(waiter);
   });

@@ -83,8 +83,9 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   // Must be closed.
   ~NatsLink();
 
-  // Calls back once with the servers' addresses, or none.
-  void discover(const TLMReportingService::BackendsCallback& found) HALVOX_EXCLUDES(mutex_);
+  // Calls back once with the servers' addresses, or none: on the thread, also when it is connected
+  // already, or on the background queue when the thread does not come to it within kDiscoveryTime.
+  void discover(TLMReportingService::BackendsCallback found) HALVOX_EXCLUDES(mutex_);
   // Why no message is taken any more; it must not even be made then, as the library has ended.
   [[nodiscard]] std::optional<Error> refuseAtEnd() HALVOX_EXCLUDES(mutex_);
   // Takes the message, or says why not.

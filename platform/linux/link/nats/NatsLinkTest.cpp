@@ -1,35 +1,15 @@
 #include "platform/linux/link/nats/NatsLink.h"
 
+#include <chrono>
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <pthread.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/testing/NoThreadsToHave.h"
 
 namespace halvox::platform::linux_ {
 namespace {
-
-// While it lives, new threads are to have stacks larger than any address space.
-class NoThreadsToHave {
- public:
-  NoThreadsToHave() {
-    pthread_getattr_default_np(&usual_);
-    pthread_attr_t huge;
-    pthread_attr_init(&huge);
-    pthread_attr_setstacksize(&huge, std::size_t{1} << 50U);
-    pthread_setattr_default_np(&huge);
-    pthread_attr_destroy(&huge);
-  }
-  NoThreadsToHave(const NoThreadsToHave&) = delete;
-  NoThreadsToHave& operator=(const NoThreadsToHave&) = delete;
-  ~NoThreadsToHave() {
-    pthread_setattr_default_np(&usual_);
-    pthread_attr_destroy(&usual_);
-  }
-
- private:
-  pthread_attr_t usual_{};
-};
 
 TEST(NatsLinkTest, WithoutAThreadThereAreNoServersAndMessagesAreRefused) {
   FakePlatform platform;
@@ -45,8 +25,10 @@ TEST(NatsLinkTest, WithoutAThreadThereAreNoServersAndMessagesAreRefused) {
       ++answers;
       servers = found;
     });
+    EXPECT_EQ(answers, 0) << "answered from inside the call";
     error = link->send(OutgoingMessage());
   }
+  platform.dispatch.advance(std::chrono::nanoseconds(0));
   const bool isEnded = link->close();
 
   EXPECT_EQ(answers, 1);

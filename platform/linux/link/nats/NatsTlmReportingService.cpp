@@ -112,7 +112,7 @@ TLMReportingService::Session NatsTlmReportingService::TLMReportingCreateSession(
 
 void NatsTlmReportingService::TLMReportingStartConfiguration(const Session&,
                                                              BackendsCallback found) {
-  link_->discover(found);
+  link_->discover(std::move(found));
 }
 
 TLMReportingOutcome NatsTlmReportingService::TLMReportingSendMessage(

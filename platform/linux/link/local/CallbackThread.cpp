@@ -1,0 +1,63 @@
+#include "platform/linux/link/local/CallbackThread.h"
+
+#include <chrono>
+#include <system_error>
+#include <utility>
+
+#include "platform/linux/runtime/ThreadSetup.h"
+
+namespace halvox::platform::linux_ {
+
+void CallbackThread::call(Callback callback) {
+  {
+    const MutexLock lock(mutex_);
+    if (isStopped_) return;
+    if (isRunning_ || provideThread()) {
+      waiting_.push_back(std::move(callback));
+      return;
+    }
+  }
+  dispatch_.asyncAfterOnBackgroundQueue(std::chrono::nanoseconds(0), std::move(callback));
+}
+
+void CallbackThread::stop() {
+  std::thread last;
+  {
+    const MutexLock lock(mutex_);
+    isStopped_ = true;
+    last = std::move(thread_);
+  }
+  if (last.joinable()) last.join();
+}
+
+// False when the system has none to give.
+bool CallbackThread::provideThread() {
+  // The last one has given the lock back for good, so this takes no longer than its end.
+  if (thread_.joinable()) thread_.join();
+  try {
+    thread_ = std::thread(&CallbackThread::run, this);
+  } catch (const std::system_error&) {
+    return false;
+  }
+  isRunning_ = true;
+  return true;
+}
+
+void CallbackThread::run() {
+  setUpThread("link callbacks");
+  while (true) {
+    Callback next;
+    {
+      const MutexLock lock(mutex_);
+      if (waiting_.empty()) {
+        isRunning_ = false;
+        return;
+      }
+      next = std::move(waiting_.front());
+      waiting_.pop_front();
+    }
+    next();
+  }
+}
+
+}  // namespace halvox::platform::linux_
