@@ -3,6 +3,7 @@
 import contextlib
 import json
 import os
+import re
 import shutil
 import signal
 import sqlite3
@@ -68,6 +69,56 @@ class Durability(unittest.TestCase):
         payloads = [payload for name, payload in service.events() if ".halvox." in name]
         self.assertEqual([(payload["run"], payload["number"]) for payload in payloads],
                          [(run, number) for run in range(2) for number in range(100)])
+
+    def fill(self, service, megabytes):
+        """Puts events of earlier runs into the database of a service that is not running."""
+        payload = json.dumps({"text": "x" * 8000})
+        with contextlib.closing(sqlite3.connect(service.database)) as database:
+            with database:
+                database.execute("INSERT OR IGNORE INTO event_names(id, name) VALUES (9, 'old')")
+                database.executemany(
+                    "INSERT INTO analytics_records(time, name_id, payload) VALUES (?, 9, ?)",
+                    ((time.time(), payload) for _ in range(megabytes * 1000 // 8)))
+            database.execute("PRAGMA wal_checkpoint(TRUNCATE)")
+
+    def stopped_service_with_a_store_of(self, megabytes):
+        service = Service()
+        self.addCleanup(shutil.rmtree, service.directory, True)
+        service.start()
+        self.assertEqual(service.stop(), 0)
+        self.fill(service, megabytes)
+        return service
+
+    def test_start_after_an_orderly_end_does_not_read_the_database(self):
+        service = self.stopped_service_with_a_store_of(40)
+        self.addCleanup(service.stop)
+        service.start()
+        read = int(re.search(r"rchar: (\d+)",
+                             Path(f"/proc/{service.process.pid}/io").read_text())[1])
+        self.assertGreater(service.database.stat().st_size, 40_000_000)
+        self.assertLess(read, 8_000_000)
+
+    def test_damage_after_a_kill_is_found_while_the_service_already_serves(self):
+        service = self.stopped_service_with_a_store_of(40)
+        service.start()
+        service.process.send_signal(signal.SIGKILL)
+        service.process.wait(harness.DEADLINE)
+        self.assertTrue(Path(f"{service.database}-wal").exists(), "the end was an orderly one")
+        with open(service.database, "r+b") as file:
+            file.seek(20_000_000)
+            file.write(b"\xa5" * 40_000)
+
+        self.addCleanup(service.stop)
+        service.start()
+        client = service.client()
+        client.send({"number": 1}, reporters=None)
+        wait_for("the damage to be found", lambda: "was set aside as" in service.log(), 120)
+        client.send({"number": 2}, reporters=None)
+        service.wait_for_payload(lambda payload: payload.get("number") == 2)
+
+        numbers = [payload["number"] for name, payload in service.events() if ".halvox." in name]
+        self.assertEqual(numbers, [1, 2])
+        self.assertEqual(len(list(service.database.parent.glob("halvox.db.damaged-*Z"))), 1)
 
 
 def send_until_the_end(address):

@@ -77,6 +77,7 @@ void SqliteStore::run() {
   };
   while (queue_.take(nextRound_, takeAll)) {
     nextRound_ = std::chrono::steady_clock::now() + queue_.limits().gatherTime;
+    if (const auto finding = check_.finding()) replaceDamaged(*finding);
     writeTaken();
     maintainWhileIdle();
   }
@@ -134,14 +135,48 @@ bool SqliteStore::logHasRoom() {
 }
 
 std::optional<StoreError> SqliteStore::openDatabase() {
+  // Closing in good order removes the log, so one that is there was left by a run that was ended.
+  const bool wasLeftOpen = files_.logBytes() > 0;
   if (auto error = openStoreDatabase(files_, sizes_, database_)) return error;
+  if (auto error = useDatabase()) return error;
+  if (wasLeftOpen) {
+    check_.begin(files_.database(), extent_, [this] { queue_.requestRound(); });
+  }
+  return std::nullopt;
+}
+
+std::optional<StoreError> SqliteStore::useDatabase() {
   identity_ = files_.identity();
-  if (prepareStatements() == SQLITE_OK) return std::nullopt;
+  SqliteCode code = StoreExtent::read(database_, extent_);
+  if (code == SQLITE_OK) code = prepareStatements();
+  if (code == SQLITE_OK) return std::nullopt;
   StoreError error{
       StoreError::Kind::kCannotOpen,
       files_.database().native() + ": cannot read the database: " + database_.errorText()};
   abandonDatabase();
   return error;
+}
+
+// The damaged file holds records of earlier runs and records of this run, which are newer than
+// `extent_`. The new database receives those of this run; all stay in the file that is set aside.
+void SqliteStore::replaceDamaged(const std::string& finding) {
+  const StoreExtent extent = extent_;
+  abandonDatabase();
+  std::string newName;
+  if (const auto error = files_.setAside(newName)) return kLog.error("", error->description);
+  kLog.error("the database is damaged: ", finding, "; it was set aside as ", newName,
+             "; beginning a new one");
+  if (const auto error = openStoreDatabase(files_, sizes_, database_)) {
+    return kLog.error("", error->description);
+  }
+  std::string problem;
+  const std::uint64_t kept = copyRecordsAfter(extent, newName, database_, problem);
+  kLog.notice("kept the ", kept, " records that were stored since the start");
+  if (!problem.empty()) {
+    kLog.error("some records that were stored since the start are only in ", newName, ": ",
+               problem);
+  }
+  if (const auto error = useDatabase()) kLog.error("", error->description);
 }
 
 SqliteCode SqliteStore::prepareStatements() {
@@ -188,15 +223,8 @@ void SqliteStore::fail(SqliteCode code, std::string_view what) {
   drop(reason, description);
   // After a lock or a full disk the connection remains usable. After any other error open it again.
   if (reason == DropReason::kLocked || reason == DropReason::kDiskFull) return;
+  if (reason == DropReason::kDamaged) return replaceDamaged(description);
   abandonDatabase();
-  if (reason != DropReason::kDamaged) return;
-  std::string newName;
-  if (const auto error = files_.setAside(newName)) {
-    kLog.error("", error->description);
-  } else {
-    kLog.error("the damaged database was set aside as ", newName,
-               "; the next record begins an empty one");
-  }
 }
 
 void SqliteStore::drop(DropReason reason, std::string_view what) {
@@ -230,6 +258,7 @@ bool SqliteStore::maintainOnce() {
 }
 
 void SqliteStore::closeDatabase() {
+  check_.stop();
   releaseStatements();
   if (!database_.isOpen()) return;
   // sqlite3_close() also copies the log, but only when no other connection is open.
@@ -238,6 +267,7 @@ void SqliteStore::closeDatabase() {
 }
 
 void SqliteStore::abandonDatabase() {
+  check_.stop();  // what it reads may be renamed next
   releaseStatements();
   abandon(database_);
 }

@@ -15,7 +15,9 @@
 #include "platform/linux/store/EventNames.h"
 #include "platform/linux/store/Retention.h"
 #include "platform/linux/store/Sqlite.h"
+#include "platform/linux/store/StoreCheck.h"
 #include "platform/linux/store/StoreError.h"
+#include "platform/linux/store/StoreExtent.h"
 #include "platform/linux/store/StoreFiles.h"
 #include "platform/linux/store/StoreOpening.h"
 #include "platform/linux/store/StoreRecords.h"
@@ -43,8 +45,9 @@ struct StoreOptions {
 //
 // Failures never reach the callers. When the disk is full, the file is locked, or reading or
 // writing fails, the store drops and counts the records at hand, logs at most one error a second,
-// and tries again with the next records. It renames a damaged file and creates a file that was
-// deleted.
+// and tries again with the next records. It renames a damaged database, begins
+// a new one, and copies into it what this run had stored. It creates a file that was deleted. A
+// database that the last run did not close is checked in the background.
 //
 // Owned by the platform. open() and close() belong to one thread.
 class SqliteStore {
@@ -88,7 +91,9 @@ class SqliteStore {
   [[nodiscard]] bool logHasRoom();
   [[nodiscard]] SqliteCode writeTransaction();
   [[nodiscard]] std::optional<StoreError> openDatabase();
+  [[nodiscard]] std::optional<StoreError> useDatabase();
   [[nodiscard]] SqliteCode prepareStatements();
+  void replaceDamaged(const std::string& finding);
   void releaseStatements();
   void fail(SqliteCode code, std::string_view what);
   void drop(DropReason reason, std::string_view what);
@@ -121,6 +126,8 @@ class SqliteStore {
   std::uint64_t droppedSinceStored_ = 0;
   OncePerSecond failureLines_;
 
+  StoreExtent extent_;  // of the open database when it was opened
+  StoreCheck check_;    // wakes the writer through the queue, which outlives it
   std::thread writer_;
 };
 

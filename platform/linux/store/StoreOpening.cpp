@@ -26,13 +26,6 @@ constexpr std::uint64_t kLargestPayload = 256 * kMegabyte;
 // How long the writer waits for a lock of another process before it drops the records at hand.
 // Half of the half second within which a stored record must be visible.
 constexpr std::chrono::milliseconds kBusyTimeout{250};
-// The start of the service waits for the check. Two seconds are enough to read more than a
-// gigabyte; damage beyond that is noticed when the page is used.
-constexpr std::chrono::seconds kCheckTime{2};
-// How many instructions of SQLite's virtual machine run between two looks at the clock.
-constexpr int kCheckSteps = 10'000;
-
-using Deadline = std::chrono::steady_clock::time_point;
 
 StoreError failure(StoreError::Kind kind, const StoreFiles& files, const std::string& what) {
   return {kind, files.database().native() + ": " + what};
@@ -66,28 +59,7 @@ std::string pragmas(const StoreSizes& sizes) {
          "; PRAGMA secure_delete = OFF; PRAGMA temp_store = MEMORY";
 }
 
-// Returns SQLITE_OK for a sound file, also when the time was over before the whole file was read.
-// `finding` receives what SQLite found, "ok" or a description of the damage.
-SqliteCode check(Database& database, std::string& finding) {
-  Deadline deadline = std::chrono::steady_clock::now() + kCheckTime;
-  sqlite3_progress_handler(
-      database.get(), kCheckSteps,
-      [](void* limit) {
-        return static_cast<int>(std::chrono::steady_clock::now() > *static_cast<Deadline*>(limit));
-      },
-      &deadline);
-  Statement statement;
-  SqliteCode code = database.prepare("PRAGMA quick_check(1)", statement);
-  if (code == SQLITE_OK) code = statement.step();
-  if (code == SQLITE_ROW) finding = statement.text(0);
-  std::ranges::replace(finding, '\n', ' ');
-  sqlite3_progress_handler(database.get(), 0, nullptr, nullptr);
-  if (code == SQLITE_INTERRUPT) return SQLITE_OK;
-  if (code != SQLITE_ROW) return code;
-  return finding == "ok" ? SQLITE_OK : SQLITE_CORRUPT;
-}
-
-// Opens and checks the file without changing it: a database of a newer version must stay as it is.
+// Opens the file without changing it: a database of a newer version must stay as it is.
 Attempt examine(const StoreFiles& files, Database& database) {
   SqliteCode code = database.open(files.database(), DatabaseAccess::kReadWrite);
   if (code != SQLITE_OK) return judged(code, files, database);
@@ -109,12 +81,7 @@ Attempt examine(const StoreFiles& files, Database& database) {
     return {Attempt::Outcome::kFailed,
             failure(StoreError::Kind::kDirectory, files, "cannot write to the database file")};
   }
-  std::string finding;
-  code = check(database, finding);
-  if (code == SQLITE_OK) return {Attempt::Outcome::kOpened};
-  Attempt result = judged(code, files, database);
-  if (!finding.empty()) result.reason.description = files.database().native() + ": " + finding;
-  return result;
+  return {Attempt::Outcome::kOpened};
 }
 
 Attempt attempt(const StoreFiles& files, const StoreSizes& sizes, Database& database) {

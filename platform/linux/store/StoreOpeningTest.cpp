@@ -105,14 +105,6 @@ TEST_F(StoreOpeningTest, SetsATruncatedDatabaseAside) {
   expectNewStoreAndOldOneSetAside();
 }
 
-TEST_F(StoreOpeningTest, SetsADatabaseWithABrokenPageAside) {
-  makeStore();
-  std::string content = readFile(database());
-  content.replace(content.size() / 2, 20'000, std::string(20'000, '\xA5'));
-  writeFile(database(), content);
-  expectNewStoreAndOldOneSetAside();
-}
-
 TEST_F(StoreOpeningTest, SetsTwoDamagedFilesAsideUnderTwoNames) {
   writeFile(database(), "not a database");
   start();

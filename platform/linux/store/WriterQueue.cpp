@@ -27,19 +27,29 @@ void WriterQueue::close() {
   room_.notifyAll();
 }
 
+void WriterQueue::requestRound() {
+  {
+    const MutexLock lock(mutex_);
+    roundRequested_ = true;
+  }
+  work_.notifyOne();
+}
+
 bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
   const MutexLock lock(mutex_);
-  while (queued_ == 0 && !closed_) {
+  while (queued_ == 0 && !closed_ && !roundRequested_) {
     writer_ = Writer::kIdle;
     work_.wait(mutex_);
   }
-  while (queued_ < gatherRecords_ && !closed_ && std::chrono::steady_clock::now() < notBefore) {
+  while (queued_ < gatherRecords_ && !closed_ && !roundRequested_ &&
+         std::chrono::steady_clock::now() < notBefore) {
     writer_ = Writer::kGathering;
     work_.waitUntil(mutex_, notBefore);
   }
   writer_ = Writer::kWorking;
   workingSince_ = std::chrono::steady_clock::now();
-  if (queued_ == 0) return false;
+  const bool wasRequested = std::exchange(roundRequested_, false);
+  if (queued_ == 0) return wasRequested;
   take();
   queued_ = 0;
   return true;

@@ -64,9 +64,13 @@ class WriterQueue {
   // the records that are queued.
   void close() HALVOX_EXCLUDES(mutex_);
 
+  // Any thread. Makes the next take() return, even when nothing is queued.
+  void requestRound() HALVOX_EXCLUDES(mutex_);
+
   // Writer only. Waits for a record, then until `notBefore` or until `gatherRecords` wait, and runs
-  // `take` under the lock. `take` must take everything that is queued. Returns false, without
-  // running it, when the queue is closed and empty.
+  // `take` under the lock. `take` must take everything that is queued. Does not wait after a
+  // requestRound(), and then need not run `take`. Returns false, without running it, when the queue
+  // is closed and empty.
   bool take(Time notBefore, const std::function<void()>& take) HALVOX_EXCLUDES(mutex_);
   // Writer only. `records` of the taken records left the store's memory, with payloads of `bytes`.
   // The queue attributes the time since the last take(), finish() or disregardTime() to them.
@@ -103,6 +107,7 @@ class WriterQueue {
   std::uint64_t softRecords_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t gatherRecords_ HALVOX_GUARDED_BY(mutex_);
   bool closed_ HALVOX_GUARDED_BY(mutex_) = false;
+  bool roundRequested_ HALVOX_GUARDED_BY(mutex_) = false;
 };
 
 }  // namespace halvox::platform::linux_

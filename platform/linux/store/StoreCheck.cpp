@@ -1,0 +1,170 @@
+#include "platform/linux/store/StoreCheck.h"
+
+#include <algorithm>
+#include <chrono>
+#include <limits>
+#include <utility>
+
+#include <linux/ioprio.h>
+#include <pthread.h>
+#include <sys/resource.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include "platform/linux/store/StoreLog.h"
+#include "platform/linux/store/StoreOpening.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog{storeCategory, "StoreCheck"};
+
+using Clock = std::chrono::steady_clock;
+
+// Short enough that the writer's checkpoints are held up for no longer than a commit takes on a
+// slow disk; long enough to read some megabytes from a fast one.
+constexpr std::chrono::milliseconds kSlice{20};
+constexpr std::chrono::milliseconds kShortestPause{1};
+constexpr std::chrono::milliseconds kBusyTimeout{250};
+
+// Others come first, for the processor and for the disk. The scheduler's own idle class would be
+// too little: on a busy machine a slice would not end for minutes, and the log would grow
+// meanwhile. Lowering needs no privilege; where the kernel refuses, the pauses alone keep the check
+// out of the way.
+void giveWayToOthers() {
+  constexpr int kNice = 10;
+  static_cast<void>(::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), kNice));
+  static_cast<void>(
+      ::syscall(SYS_ioprio_set, IOPRIO_WHO_PROCESS, 0, IOPRIO_PRIO_VALUE(IOPRIO_CLASS_IDLE, 0)));
+}
+
+// Reads rows until the slice is over: SQLITE_ROW then, SQLITE_DONE after the last row, or an error.
+// Stepping loads every column, with the pages that a long payload continues on.
+SqliteCode readSlice(Statement& rows, std::int64_t& last, std::uint64_t& count) {
+  const auto end = Clock::now() + kSlice;
+  SqliteCode code = SQLITE_ROW;
+  while ((code = rows.step()) == SQLITE_ROW) {
+    // In a damaged table numbers may not grow, and then the check would never end.
+    if (rows.integer(0) <= last) return SQLITE_CORRUPT;
+    last = rows.integer(0);
+    ++count;
+    if (Clock::now() >= end) break;
+  }
+  return code;
+}
+
+}  // namespace
+
+void StoreCheck::begin(const std::string& file, const StoreExtent& extent, OnDamage onDamage) {
+  stop();
+  records_ = 0;
+  thread_ = std::thread(
+      [this, file, extent, onDamage = std::move(onDamage)] { run(file, extent, onDamage); });
+}
+
+void StoreCheck::stop() {
+  {
+    const MutexLock lock(mutex_);
+    isStopping_ = true;
+  }
+  stopping_.notifyAll();
+  if (thread_.joinable()) thread_.join();
+  const MutexLock lock(mutex_);
+  isStopping_ = false;
+  finding_.reset();
+}
+
+std::optional<std::string> StoreCheck::finding() {
+  const MutexLock lock(mutex_);
+  return finding_;
+}
+
+void StoreCheck::run(const std::string& file, const StoreExtent& extent, const OnDamage& onDamage) {
+  ::pthread_setname_np(::pthread_self(), "halvox-check");
+  giveWayToOthers();
+  kLog.info("checking ", file, " in the background: the last run did not close it");
+  Database database;
+  std::string what;
+  Outcome outcome = Outcome::kUnreadable;
+  if (database.open(file, DatabaseAccess::kReadOnly) == SQLITE_OK) {
+    sqlite3_busy_timeout(database.get(), static_cast<int>(kBusyTimeout.count()));
+    outcome = readAll(database, extent, what);
+  } else {
+    what = database.errorText();
+  }
+  switch (outcome) {
+    case Outcome::kGoOn:
+      kLog.info("checked ", file, ": read ", records_, " records and found no damage");
+      return;
+    case Outcome::kStopped:
+      return;
+    case Outcome::kUnreadable:
+      kLog.error("cannot check ", file, ": ", what, "; giving up until the next start");
+      return;
+    case Outcome::kDamaged:
+      break;
+  }
+  {
+    const MutexLock lock(mutex_);
+    finding_ = what;
+  }
+  onDamage();
+}
+
+StoreCheck::Outcome StoreCheck::readAll(Database& database, const StoreExtent& extent,
+                                        std::string& what) {
+  // The names are few, and the only table with an index, which reading rows does not reach.
+  Statement names;
+  SqliteCode code = database.prepare("PRAGMA quick_check(event_names)", names);
+  if (code == SQLITE_OK) code = names.step();
+  if (code == SQLITE_ROW && names.text(0) != "ok") {
+    what = names.text(0);
+    std::ranges::replace(what, '\n', ' ');
+    return Outcome::kDamaged;
+  }
+  if (code != SQLITE_ROW) {
+    what = database.errorText();
+    return meansDamage(code) ? Outcome::kDamaged : Outcome::kUnreadable;
+  }
+  names = {};
+  for (std::size_t kind = 0; kind < kKindTables.size(); ++kind) {
+    const KindTables& tables = kKindTables[kind];
+    for (const auto& [table, newest] :
+         {std::pair{tables.records, extent.newest[kind]},
+          std::pair{tables.spans, std::numeric_limits<std::int64_t>::max()}}) {
+      const Outcome outcome = readTable(database, std::string(table), newest, what);
+      if (outcome != Outcome::kGoOn) return outcome;
+    }
+  }
+  return Outcome::kGoOn;
+}
+
+StoreCheck::Outcome StoreCheck::readTable(Database& database, const std::string& table,
+                                          std::int64_t newest, std::string& what) {
+  Statement rows;
+  SqliteCode code = database.prepare(
+      "SELECT rowid, * FROM " + table + " WHERE rowid > ?1 AND rowid <= ?2 ORDER BY rowid", rows);
+  if (code == SQLITE_OK) code = SQLITE_ROW;
+  std::int64_t last = std::numeric_limits<std::int64_t>::min();
+  while (code == SQLITE_ROW) {
+    const auto begun = Clock::now();
+    rows.bind(1, last);
+    rows.bind(2, newest);
+    code = readSlice(rows, last, records_);
+    if (code != SQLITE_ROW && code != SQLITE_DONE) what = table + ": " + database.errorText();
+    rows.reset();
+    if (!pause(Clock::now() - begun)) return Outcome::kStopped;
+  }
+  if (code == SQLITE_DONE) return Outcome::kGoOn;
+  return meansDamage(code) ? Outcome::kDamaged : Outcome::kUnreadable;
+}
+
+bool StoreCheck::pause(Clock::duration length) {
+  const auto until = Clock::now() + std::max<Clock::duration>(length, kShortestPause);
+  const MutexLock lock(mutex_);
+  while (!isStopping_ && stopping_.waitUntil(mutex_, until)) {
+  }
+  return !isStopping_;
+}
+
+}  // namespace halvox::platform::linux_

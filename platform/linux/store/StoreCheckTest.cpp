@@ -1,0 +1,188 @@
+#include "platform/linux/store/StoreCheck.h"
+
+#include <algorithm>
+#include <functional>
+#include <string>
+
+#include "platform/linux/store/StoreTestSupport.h"
+
+// What the store does with a database that the last run did not close.
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using ::testing::AllOf;
+using ::testing::Contains;
+using ::testing::ElementsAre;
+using ::testing::HasSubstr;
+using ::testing::IsEmpty;
+using ::testing::Not;
+using ::testing::SizeIs;
+
+constexpr std::int64_t kEvents = 4000;
+
+class StoreCheckTest : public StoreTest {
+ protected:
+  // Leaves the files of a run that stored events and was then killed.
+  void leaveKilledStore() {
+    start();
+    for (std::int64_t number = 0; number < kEvents; ++number) send(number);
+    ASSERT_TRUE(allIsStored());
+    // Into the database itself, so that the log holds only a little.
+    execute(database(), "PRAGMA wal_checkpoint(FULL)");
+    send(kEvents);
+    ASSERT_TRUE(allIsStored());
+    const std::string content = readFile(database());
+    const std::string log = readFile(logFile());
+    stop();
+    writeFile(database(), content);
+    writeFile(logFile(), log);
+  }
+  // Overwrites pages that hold records, as a failing disk does.
+  void damage() {
+    std::string content = readFile(database());
+    content.replace(content.size() / 2, 20'000, std::string(20'000, '\xA5'));
+    writeFile(database(), content);
+  }
+  // The check gives way to everything else that runs on the machine, so these wait long.
+  bool eventuallySetAside() {
+    return patiently([this] { return !setAsideFiles().empty(); });
+  }
+  bool eventuallyLogged(LogLevel level, const std::string& text) {
+    return patiently([&] {
+      return std::ranges::any_of(platform.log.texts(level), [&](const auto& line) {
+        return line.find(text) != std::string::npos;
+      });
+    });
+  }
+
+ private:
+  static bool patiently(const std::function<bool()>& holds) {
+    constexpr int kTries = 6;
+    for (int attempt = 0; attempt < kTries; ++attempt) {
+      if (eventually(holds)) return true;
+    }
+    return false;
+  }
+  [[nodiscard]] std::filesystem::path logFile() const { return database().native() + "-wal"; }
+};
+
+TEST_F(StoreCheckTest, FindsNoDamageInADatabaseWhoseServiceWasKilled) {
+  leaveKilledStore();
+  start();
+  EXPECT_TRUE(eventuallyLogged(LogLevel::kInfo, "found no damage"));
+  stop();
+  EXPECT_THAT(setAsideFiles(), IsEmpty());
+  EXPECT_THAT(payloads(), SizeIs(kEvents + 1));
+}
+
+TEST_F(StoreCheckTest, SaysHowManyRecordsItRead) {
+  leaveKilledStore();
+  start();
+  // The events and the spans of 512 records that sum up their times.
+  EXPECT_TRUE(eventuallyLogged(LogLevel::kInfo, "read 4009 records"))
+      << ::testing::PrintToString(platform.log.texts(LogLevel::kInfo));
+}
+
+TEST_F(StoreCheckTest, SetsADatabaseWithABrokenPageAside) {
+  leaveKilledStore();
+  damage();
+  start();
+  ASSERT_TRUE(eventuallySetAside());
+  stop();
+  EXPECT_THAT(platform.log.texts(LogLevel::kError),
+              Contains(AllOf(HasSubstr("was set aside as " + setAsideFiles().front().native()),
+                             HasSubstr("analytics_records"))));
+  EXPECT_THAT(rows(database(), "PRAGMA integrity_check"), ElementsAre("ok"));
+}
+
+TEST_F(StoreCheckTest, KeepsWhatWasStoredBeforeTheDamageWasFound) {
+  leaveKilledStore();
+  damage();
+  start();
+  send(-1, "com.tarno.one");
+  send(-2, "com.tarno.two");
+  ASSERT_TRUE(eventuallySetAside());
+  send(-3, "com.tarno.one");
+  stop();
+
+  EXPECT_THAT(rows(database(), "SELECT name, payload FROM analytics_events ORDER BY payload"),
+              ElementsAre("com.tarno.one|" + numbered(-1), "com.tarno.two|" + numbered(-2),
+                          "com.tarno.one|" + numbered(-3)));
+  EXPECT_EQ(dropped(), 0U);
+}
+
+TEST_F(StoreCheckTest, KeepsRecordsOfEveryKindStoredBeforeTheDamageWasFound) {
+  leaveKilledStore();
+  damage();
+  start();
+  const double now = platform.clock.currentDate().secondsSince1970;
+  const Dictionary payload{{"f", 1}};
+  store->issueMetrics().add({.time = now, .metricID = 1, .message = std::vector<std::byte>(3)});
+  store->powerEvents().add({.time = now, .eventName = "e", .payload = payload});
+  store->linkMessages().add(
+      {.time = now, .party = std::make_shared<LinkParty>(), .payload = payload});
+  store->snapshots().add({.time = now, .signature = payload, .path = "/s"});
+  ASSERT_TRUE(eventuallySetAside());
+  stop();
+
+  for (const KindTables& tables : kKindTables) {
+    if (tables.records == "analytics_records") continue;
+    EXPECT_THAT(rows(database(), "SELECT count(*) FROM " + std::string(tables.records)),
+                ElementsAre("1"))
+        << tables.records;
+    EXPECT_THAT(rows(database(), "SELECT count(*) FROM " + std::string(tables.spans)),
+                ElementsAre("1"))
+        << tables.spans;
+  }
+}
+
+TEST_F(StoreCheckTest, KeepsTheDamagedDatabaseWithItsLog) {
+  leaveKilledStore();
+  damage();
+  const std::string damaged = readFile(database()).substr(0, 100);
+  start();
+  ASSERT_TRUE(eventuallySetAside());
+  stop();
+  EXPECT_EQ(readFile(setAsideFiles().front()).substr(28, 4), damaged.substr(28, 4));
+}
+
+TEST_F(StoreCheckTest, ReadsNothingAfterAnOrderlyEnd) {
+  start();
+  for (std::int64_t number = 0; number < kEvents; ++number) send(number);
+  stop();
+  damage();
+  start();
+  send(kEvents);
+  ASSERT_TRUE(allIsStored());
+  stop();
+  EXPECT_THAT(setAsideFiles(), IsEmpty());
+  EXPECT_THAT(platform.log.texts(LogLevel::kInfo), Not(Contains(HasSubstr("in the background"))));
+}
+
+TEST_F(StoreCheckTest, FindsADamagedTableOfNames) {
+  leaveKilledStore();
+  // Both pages of the table and of its index are among the first.
+  const auto root = rows(
+      database(), "SELECT rootpage FROM sqlite_schema WHERE name LIKE 'sqlite_autoindex_event%'");
+  ASSERT_THAT(root, SizeIs(1));
+  std::string content = readFile(database());
+  const std::size_t page = 8192;
+  content.replace((std::stoul(root.front()) - 1) * page + 8, 64, std::string(64, '\x7F'));
+  writeFile(database(), content);
+  start();
+  EXPECT_TRUE(eventuallySetAside());
+}
+
+TEST_F(StoreCheckTest, StopsInTheMiddleWhenTheStoreCloses) {
+  leaveKilledStore();
+  for (int run = 0; run < 20; ++run) {
+    ASSERT_EQ(open(), std::nullopt);
+    stop();
+    writeFile(database().native() + "-wal", std::string(32, '\0'));
+  }
+  EXPECT_THAT(setAsideFiles(), IsEmpty());
+}
+
+}  // namespace
+}  // namespace halvox::platform::linux_

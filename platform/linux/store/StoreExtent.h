@@ -1,0 +1,44 @@
+#pragma once
+
+#include <array>
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+#include "platform/linux/store/Sqlite.h"
+
+namespace halvox::platform::linux_ {
+
+// The tables of one kind of record, as the schema makes them.
+struct KindTables {
+  std::string_view records;
+  std::string_view spans;
+};
+
+inline constexpr std::array<KindTables, 5> kKindTables{{
+    {"analytics_records", "analytics_spans"},
+    {"issue_metric_records", "issue_metric_spans"},
+    {"power_event_records", "power_event_spans"},
+    {"link_message_records", "link_message_spans"},
+    {"snapshot_records", "snapshot_spans"},
+}};
+
+// The number of the newest record of each kind, in the order of kKindTables; 0 when there is none.
+// Taken when a store opens its database, it separates what earlier runs wrote from what this run
+// writes, because record numbers only grow.
+struct StoreExtent {
+  std::array<std::int64_t, kKindTables.size()> newest{};
+
+  // Reads the last page of each table. SQLITE_OK or an error.
+  [[nodiscard]] static SqliteCode read(Database& database, StoreExtent& extent);
+};
+
+// Copies the records that are newer than `extent` from the database in `file` into `database`,
+// which must be open for writing, have all tables, and hold no record. A kind that cannot be read
+// is skipped. Returns how many records were copied; `problem` says what could not be, and is empty
+// when everything was. Blocks on the disk.
+[[nodiscard]] std::uint64_t copyRecordsAfter(const StoreExtent& extent, const std::string& file,
+                                             Database& database, std::string& problem);
+
+}  // namespace halvox::platform::linux_
