@@ -5,7 +5,8 @@
 
 namespace halvox::pipewire_reporter {
 
-// Hands the reporter's operations on to the client library, which it borrows.
+// Passes the reporter's operations to the client library, which it does not own and which must
+// outlive it. Failures and losses are handled and counted by the library.
 class HalvoxReportingClient final : public ReportingClient {
  public:
   explicit HalvoxReportingClient(client::HalvoxClient& client) : client_(client) {}
@@ -18,7 +19,7 @@ class HalvoxReportingClient final : public ReportingClient {
     client_.setConfiguration(id, configuration);
   }
   void start(ReporterID id) override { client_.start(id); }
-  // What is dropped is counted by the client library.
+  // The result is ignored: the library counts messages that it drops.
   void send(ReporterID id, const platform::Dictionary& message, Category category,
             EventType type) override {
     static_cast<void>(client_.send(id, message, category, type));

@@ -17,10 +17,9 @@ class MainLoop::Impl {
     loop_ = pw_main_loop_new(nullptr);
     if (loop_ == nullptr) {
       pw_deinit();
-      throw std::runtime_error("cannot make the event loop");
+      throw std::runtime_error("cannot create the event loop of PipeWire's library");
     }
-    // A signal that is blocked here is blocked in every thread made later, and so comes to the
-    // loop.
+    // This blocks the signals, also for threads that are made later. They reach the loop instead.
     for (const int number : {SIGTERM, SIGINT}) {
       pw_loop_add_signal(handle(), number, &Impl::onSignal, this);
     }
@@ -40,7 +39,7 @@ class MainLoop::Impl {
     calls_.push_back(std::make_unique<std::function<void()>>(std::move(call)));
     spa_source* source = pw_loop_add_event(handle(), &Impl::onEvent, calls_.back().get());
     if (source == nullptr) {
-      throw std::runtime_error("cannot make an event");
+      throw std::runtime_error("cannot create an event for the event loop");
     }
     return [loop = handle(), source] { pw_loop_signal_event(loop, source); };
   }

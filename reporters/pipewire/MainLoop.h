@@ -7,12 +7,13 @@ struct pw_loop;
 
 namespace halvox::pipewire_reporter {
 
-// The loop of the reporter: PipeWire's events, the end asked for by a signal, and calls that other
-// threads ask for. It sleeps until one of them comes.
-// Make one a process, before any other thread: it takes SIGTERM and SIGINT over from all of them.
+// The event loop of the reporter. Handles PipeWire's events, SIGTERM and SIGINT, and calls that
+// other threads request; sleeps between them without a timer.
+// Make one in a process, and make it before any other thread. The constructor blocks the two
+// signals, and threads inherit that; a thread made earlier would still be ended by them.
 class MainLoop {
  public:
-  // Throws std::runtime_error when the process has no descriptors left.
+  // Throws std::runtime_error when the loop cannot be made, for example without free descriptors.
   MainLoop();
   ~MainLoop();
   MainLoop(const MainLoop&) = delete;
@@ -20,11 +21,12 @@ class MainLoop {
 
   // Runs until SIGTERM, SIGINT or quit().
   void run();
-  // Ends run(). On the loop's thread only; from another one, by way of a notifier.
+  // Ends run(). Call it on the loop's thread only; other threads use a notifier.
   void quit();
 
-  // A function that any thread may call, without blocking, to have `call` run on the loop; calls
-  // that come close together may be run as one. It must not outlive the loop.
+  // Returns a function that makes the loop run `call`. Any thread may call that function; it does
+  // not block. Several calls before the loop wakes up run `call` once. Do not use it after the loop
+  // is destroyed. Throws std::runtime_error without free descriptors.
   std::function<void()> makeNotifier(std::function<void()> call);
 
   [[nodiscard]] pw_loop* handle() const;

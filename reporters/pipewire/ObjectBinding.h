@@ -15,7 +15,8 @@ using pipewire::ObjectBinding;
 
 Properties makeProperties(const spa_dict* dict);
 
-// A client of the server: tells its properties whenever they change.
+// Follows the properties of one client of the server, and calls `changed` when they change. Belongs
+// to the loop thread. If the server refuses the binding, `changed` is never called.
 class ClientBinding {
  public:
   ClientBinding(pw_registry* registry, std::uint32_t id, std::function<void()> changed);
@@ -30,7 +31,7 @@ class ClientBinding {
   ObjectBinding binding_;
 };
 
-// What a StreamBinding tells, on the loop thread.
+// Receives the events of a StreamBinding on the loop thread.
 class StreamListener {
  public:
   StreamListener() = default;
@@ -43,13 +44,14 @@ class StreamListener {
   virtual void onStreamParam(std::uint32_t id, std::uint32_t param, const spa_pod* value) = 0;
 };
 
-// A stream node of the server: tells its properties first, then its state and parameters, and each
-// again when it changes. Borrows the listener, which must outlive it.
+// Follows one stream node of the server. Passes its properties, then its state and parameters to
+// the listener, and each of them again when it changes. Belongs to the loop thread. Does not own
+// the listener, which must outlive it. If the server refuses the binding, no event comes.
 class StreamBinding {
  public:
   StreamBinding(pw_registry* registry, std::uint32_t id, StreamListener& listener);
 
-  // Empty until the server has told them.
+  // Empty until the server has sent them.
   [[nodiscard]] const Properties& properties() const { return properties_; }
 
  private:

@@ -14,7 +14,7 @@
 namespace halvox::pipewire_reporter {
 namespace {
 
-// The last part of a type's name, such as "S16LE"; "unknown" when there is no such type.
+// Returns the last part of a type's name, such as "S16LE", or "unknown".
 std::string typeName(const spa_type_info* types, std::uint32_t type) {
   const char* name = spa_debug_type_find_short_name(types, type);
   return name == nullptr ? "unknown" : name;
@@ -30,7 +30,8 @@ std::optional<bool> readBool(const spa_pod& value) {
   return spa_pod_get_bool(&value, &flag) == 0 ? std::optional(flag) : std::nullopt;
 }
 
-// By hand, because the library's copying believes the element size that the array claims.
+// Copies the array without the library's function, which trusts the element size that the sender
+// of the array claims.
 std::optional<std::vector<float>> readFloats(const spa_pod& value) {
   if (spa_pod_is_array(&value) == 0) {
     return std::nullopt;
@@ -46,7 +47,8 @@ std::optional<std::vector<float>> readFloats(const spa_pod& value) {
   return numbers;
 }
 
-// The fields of a raw format that are of interest; its channel positions are not touched.
+// Reads encoding, rate and channels of a raw format. Does not use the library's parser for the
+// whole format, which would also read the channel positions.
 std::optional<StreamFormat> readRawFormat(const spa_pod* param) {
   std::uint32_t encoding = 0;
   std::int32_t rate = 0;

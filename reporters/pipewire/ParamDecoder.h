@@ -8,10 +8,14 @@ struct spa_pod;
 
 namespace halvox::pipewire_reporter {
 
-// The format in a Format parameter; nothing when it is no audio format that can be read.
+// Parameters come from other processes, so these functions accept anything, null included. Any
+// thread may call.
+
+// Returns the format in a Format parameter; std::nullopt if it is not a readable audio format.
 std::optional<StreamFormat> decodeFormat(const spa_pod* param);
 
-// The volume controls in a Props parameter; none are set when it holds none.
+// Returns the volume controls in a Props parameter. Controls that are missing, or have another
+// type, stay unset.
 VolumeChange decodeVolume(const spa_pod* param);
 
 }  // namespace halvox::pipewire_reporter

@@ -24,7 +24,7 @@ class ParamDecoderTest : public testing::Test {
         SPA_FORMAT_AUDIO_rate, SPA_POD_Int(rate), SPA_FORMAT_AUDIO_channels,
         SPA_POD_Int(channels)));
   }
-  // A Props object with one array of floats, whose elements claim to be that large.
+  // Makes a Props object with an array of floats whose elements claim to have that size.
   spa_pod* makeChannelVolumes(std::uint32_t elementSize, std::uint32_t type, const void* elements,
                               std::uint32_t count) {
     spa_pod_frame frame{};

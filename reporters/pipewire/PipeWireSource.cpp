@@ -31,7 +31,7 @@ constexpr milliseconds kReconnectMax{5000};
 constexpr std::string_view kClientIDProperty = "client.id";
 constexpr std::string_view kSerialProperty = "object.serial";
 
-// The number under a key, or 0 when there is none that fits.
+// Returns the number under a key, or 0 when there is none or it is too large.
 GlobalID idProperty(const Properties& properties, std::string_view key) {
   const auto number = parseNumber(property(properties, key)).value_or(0);
   return number <= UINT32_MAX ? static_cast<GlobalID>(number) : 0;
@@ -44,7 +44,8 @@ void fillIn(Properties& properties, std::string_view key, std::string_view value
   }
 }
 
-// A stream's own properties, and behind them what its client says about the application.
+// Returns a stream's properties, completed by what its client says about the application. The
+// stream's own properties take precedence.
 Properties withClient(const Properties& stream, const Properties& client) {
   Properties all = stream;
   for (const auto& [key, value] : client) {
@@ -52,7 +53,7 @@ Properties withClient(const Properties& stream, const Properties& client) {
       fillIn(all, key, value);
     }
   }
-  // What the server knows of the process at the other end of the socket.
+  // The server took this process ID from the socket's credentials.
   if (const auto pid = property(client, "pipewire.sec.pid"); !pid.empty()) {
     fillIn(all, "application.process.id", pid);
   }
@@ -61,8 +62,8 @@ Properties withClient(const Properties& stream, const Properties& client) {
 
 }  // namespace
 
-// The timer and the callbacks run on the loop thread; a callback of an object may destroy other
-// objects, never its own.
+// The timer and all callbacks run on the loop thread. A callback may destroy bindings of other
+// objects, but not the one that called it: the library still uses that one.
 class PipeWireSource::Impl final : public StreamListener {
  public:
   Impl(pw_loop* loop, StreamTracker& tracker, Options options)
@@ -73,11 +74,11 @@ class PipeWireSource::Impl final : public StreamListener {
       throw std::runtime_error(fmt::format("cannot set up PipeWire's library: {}",
                                            std::generic_category().message(errno)));
     }
-    // Teaches the library the profiler's messages; without it there is no profiler for us.
+    // Without this module the library cannot decode the profiler's messages.
     if (options_.xruns && pw_context_load_module(context_.get(), PW_EXTENSION_MODULE_PROFILER,
                                                  nullptr, nullptr) == nullptr) {
       options_.xruns = false;
-      options_.log("cannot tell xruns: PipeWire's profiler module is not installed");
+      options_.log("xruns are not reported: PipeWire's profiler module is not installed");
     }
     connect();
   }
@@ -111,8 +112,8 @@ class PipeWireSource::Impl final : public StreamListener {
   static void onGlobalRemove(void* data, std::uint32_t id);
 
   struct Stream {
-    Properties announced;  // what the server said of it to everybody
-    bool told = false;     // the tracker knows it
+    Properties announced;  // from the registry; the stream's client cannot change these
+    bool told = false;     // the tracker knows the stream
     std::unique_ptr<StreamBinding> binding;
   };
 
@@ -130,7 +131,7 @@ class PipeWireSource::Impl final : public StreamListener {
   spa_hook registryHook_{};
   std::unordered_map<GlobalID, Stream> streams_;
   std::unordered_map<GlobalID, std::unique_ptr<ClientBinding>> clients_;
-  std::optional<GlobalID> profilerID_;  // what the server announced
+  std::optional<GlobalID> profilerID_;  // set while the server has a profiler
   std::unique_ptr<ProfilerBinding> profiler_;
 };
 
@@ -218,7 +219,8 @@ void PipeWireSource::Impl::removeGlobal(GlobalID id) {
   tracker_.nodeRemoved(id);
 }
 
-// Never from within a callback of the profiler.
+// Follows the profiler only while there are streams: it wakes this process. Must not be called from
+// a callback of the profiler, whose binding it may destroy.
 void PipeWireSource::Impl::updateProfiler() {
   if (!profilerID_.has_value() || streams_.empty()) {
     profiler_.reset();
@@ -258,7 +260,8 @@ void PipeWireSource::Impl::onStreamProperties(GlobalID id, const Properties& pro
     tracker_.streamPropertiesChanged(id, all);
     return;
   }
-  // Class and serial as the server announced them: the stream's client can change its own copy.
+  // Take class and serial from the registry: the client of the stream can change the copies in the
+  // stream's own properties, and the serial is part of the session's identifier.
   tracker_.nodeAdded({.id = id,
                       .serial = idProperty(stream.announced, kSerialProperty),
                       .mediaClass = std::string(property(stream.announced, PW_KEY_MEDIA_CLASS)),
@@ -299,14 +302,15 @@ void PipeWireSource::Impl::onCoreError(void* data, std::uint32_t id, int /*seque
                                        const char* message) {
   auto* self = static_cast<Impl*>(data);
   if (id != PW_ID_CORE || result != -EPIPE) {
-    // An object that went before it could be asked is no news; anything else may be.
+    // ENOENT means that the object vanished before this process could bind it, which is normal.
     if (result != -ENOENT) {
-      self->options_.log(fmt::format("PipeWire refused: {} (object {})", message, id));
+      self->options_.log(
+          fmt::format("PipeWire refused a request: {} (object {}); it is ignored", message, id));
     }
     return;
   }
-  self->options_.log("PipeWire has gone");
-  // From the timer, because the connection cannot be closed from within its own callback.
+  self->options_.log("PipeWire has disconnected; its sessions end, and connecting is tried again");
+  // Let the timer close the connection: the library does not allow that in its own callback.
   self->retryAfter(kReconnectSoon);
 }
 

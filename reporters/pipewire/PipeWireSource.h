@@ -11,26 +11,27 @@ struct pw_loop;
 
 namespace halvox::pipewire_reporter {
 
-// Watches a PipeWire server and tells a StreamTracker what its nodes, links and clients do.
+// Follows the nodes, links and clients of a PipeWire server and passes their changes to a
+// StreamTracker.
 //
 //   waiting ──connected──► watching ──server gone──► waiting (all streams gone)
 //
-// While no server is there it tries again, first after a tenth of a second, then at doubling
-// distances up to five seconds. Belongs to the loop thread and lives no longer than the loop and
-// the tracker, which it borrows. Failures of single objects (no permission, gone before they could
-// be asked) are logged; the object is left alone.
+// Without a server it tries to connect after 0.1 s, then after twice as long each time, up to 5 s.
+// Belongs to the loop thread. Does not own the loop and the tracker, which must outlive it. An
+// object that cannot be followed, for example for lack of permission, is logged and ignored.
 class PipeWireSource {
  public:
   struct Options {
-    std::string remote;  // the server's socket name; empty: PipeWire's own choice
-    // Told lines for a person: what it connects to, loses and cannot follow.
+    std::string remote;  // the server's socket name; empty: PipeWire's default
+    // Receives log lines for a person. Called on the loop thread.
     std::function<void(std::string_view line)> log;
-    // Whether to follow the server's profiler while there are streams, which tells what they miss.
-    // It wakes the process several times a second while streams run.
+    // Whether to follow the server's profiler, which reports missed cycles, while there are
+    // streams. The profiler wakes this process several times a second while streams run.
     bool xruns = true;
   };
 
-  // Throws std::runtime_error when the library cannot be set up at all.
+  // Throws std::runtime_error when PipeWire's library cannot be set up. A missing server is not an
+  // error.
   PipeWireSource(pw_loop* loop, StreamTracker& tracker, Options options);
   ~PipeWireSource();
   PipeWireSource(const PipeWireSource&) = delete;

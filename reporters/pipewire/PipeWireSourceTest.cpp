@@ -18,7 +18,7 @@ namespace {
 using std::chrono::steady_clock;
 constexpr std::chrono::seconds kDeadline{30};
 
-// Real streams of a private PipeWire, and what the reporter makes of them.
+// What the reporter sends for real streams of a private PipeWire.
 class PipeWireSourceTest : public testing::Test {
  protected:
   void SetUp() override {
@@ -38,7 +38,7 @@ class PipeWireSourceTest : public testing::Test {
     }
   }
 
-  // Follows anew, with our log.
+  // Makes a new source that logs to `log`.
   void follow(PipeWireSource::Options options) {
     options.log = [this](std::string_view line) { log.emplace_back(line); };
     source.reset();
@@ -50,7 +50,7 @@ class PipeWireSourceTest : public testing::Test {
       pw_loop_iterate(loop->handle(), 100);
     }
   }
-  // Runs the loop until that operation has come `count` times, or the deadline.
+  // Runs the loop until the operation was recorded `count` times, at most until the deadline.
   [[nodiscard]] bool waitFor(const std::string& operation, long count = 1) const {
     return waitUntil([&] { return std::ranges::count(client.operations(), operation) >= count; });
   }
@@ -148,7 +148,7 @@ TEST_F(PipeWireSourceTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItRe
 }
 
 TEST_F(PipeWireSourceTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
-  // What all reports so far say was lost, in seconds.
+  // The sum of the losses in all reports so far, in seconds.
   const auto silence = [this] {
     double sum = 0;
     for (const auto& call : client.calls()) {
@@ -160,7 +160,7 @@ TEST_F(PipeWireSourceTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
   };
   const ChildProcess player = play(20);
   ASSERT_TRUE(waitFor("volume"));
-  // A busy machine misses cycles by itself; undisturbed, a second passes without a report.
+  // A busy machine misses cycles by itself. Wait for a second without a report.
   double before = -1;
   for (int second = 0; second < 10 && before != silence(); ++second) {
     before = silence();
@@ -201,7 +201,7 @@ TEST_F(PipeWireSourceTest, SleepsWhileNothingChangesWithoutXruns) {
 
   const ChildProcess player = play(20);
   ASSERT_TRUE(waitFor("volume"));
-  // What still comes of the start comes within moments.
+  // Let the last events of the start arrive.
   while (pw_loop_iterate(loop->handle(), 500) > 0) {
   }
 

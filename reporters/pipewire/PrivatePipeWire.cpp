@@ -26,7 +26,7 @@ void append(std::string& bytes, Number number) {
   }
 }
 
-// A mono WAV file with 16-bit samples.
+// Returns a mono WAV file with 16-bit samples.
 std::string makeWave(const std::string& samples) {
   std::string file = "RIFF";
   append(file, static_cast<std::uint32_t>(36 + samples.size()));
@@ -55,7 +55,7 @@ ChildProcess::ChildProcess(const std::vector<std::string>& command) {
   posix_spawn_file_actions_init(&actions);
   posix_spawn_file_actions_adddup2(&actions, input[0], STDIN_FILENO);
   posix_spawn_file_actions_adddup2(&actions, output[1], STDOUT_FILENO);
-  // The event loop blocks the signals that end programs, and children inherit that.
+  // Unblock all signals: the event loop blocks SIGTERM and SIGINT, and children inherit that.
   sigset_t noSignals;
   sigemptyset(&noSignals);
   posix_spawnattr_t attributes{};

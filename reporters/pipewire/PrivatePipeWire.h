@@ -9,8 +9,9 @@
 
 namespace halvox::pipewire_reporter {
 
-// For tests: a child process with pipes to its standard input and from its standard output.
-// Its destruction ends it, by closing the first and a signal, and waits for it.
+// For tests: a child process with pipes to its standard input and output. The destructor closes the
+// input, sends SIGTERM and waits for the process. A program that cannot be started is one that has
+// ended.
 class ChildProcess {
  public:
   explicit ChildProcess(const std::vector<std::string>& command);
@@ -19,10 +20,10 @@ class ChildProcess {
   ChildProcess& operator=(const ChildProcess&) = delete;
 
   void writeLine(const std::string& line) const;
-  // The next line of its output; empty when it has ended.
+  // Waits for the next line of output; returns an empty text when the process has ended.
   std::string readLine() const;
   void signal(int number) const;
-  // Waits for its end and returns its exit status.
+  // Waits for the end of the process. Returns its exit status, or -1 after a signal.
   int wait();
 
  private:
@@ -31,11 +32,11 @@ class ChildProcess {
   int output_ = -1;
 };
 
-// For tests: a PipeWire of our own with WirePlumber and a null sink, without hardware, in a scratch
-// directory. This process and its children use it as long as it lives.
+// For tests: a private PipeWire server with WirePlumber and a null sink, without hardware, in a
+// scratch directory. Changes the environment so that this process and its children use it.
 class PrivatePipeWire {
  public:
-  // The tools that it needs and that are not installed; empty when it can run.
+  // Names the required tools that are not installed; empty if there are none.
   static std::string missingTools();
 
   PrivatePipeWire();
@@ -44,9 +45,9 @@ class PrivatePipeWire {
   PrivatePipeWire& operator=(const PrivatePipeWire&) = delete;
 
   [[nodiscard]] bool isReady() const { return ready_; }
-  // Stops and starts the servers; true when streams can run again.
+  // Stops and starts the servers. Returns true when streams can run again.
   [[nodiscard]] bool restart() const;
-  // A file with that many seconds of a tone.
+  // Writes a WAV file with a tone and returns its path.
   [[nodiscard]] std::string makeTone(double seconds) const;
   [[nodiscard]] const std::filesystem::path& directory() const { return directory_; }
 

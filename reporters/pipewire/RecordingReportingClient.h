@@ -9,7 +9,7 @@
 
 namespace halvox::pipewire_reporter {
 
-// For tests: keeps what it was asked, each operation as one word and its details.
+// For tests: records each operation as one word with its details.
 class RecordingReportingClient final : public ReportingClient {
  public:
   struct Call {
@@ -35,13 +35,13 @@ class RecordingReportingClient final : public ReportingClient {
   void destroySession(ReporterID id) override { calls_.push_back({"destroy", id, 0, {}}); }
 
   [[nodiscard]] const std::vector<Call>& calls() const { return calls_; }
-  // The names alone, in order.
+  // Returns the names of the operations, in order.
   [[nodiscard]] std::vector<std::string> operations() const {
     std::vector<std::string> names;
     std::ranges::transform(calls_, std::back_inserter(names), &Call::operation);
     return names;
   }
-  // What the last call of that name carried; nothing when there was none.
+  // Returns the dictionary of the last operation of that name; empty if there was none.
   [[nodiscard]] platform::Dictionary last(const std::string& operation) const {
     const auto found = std::find_if(calls_.rbegin(), calls_.rend(),
                                     [&](const Call& call) { return call.operation == operation; });

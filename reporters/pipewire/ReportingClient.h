@@ -11,9 +11,9 @@ using ServiceType = std::uint16_t;
 using Category = std::uint32_t;
 using EventType = std::uint16_t;
 
-// What the reporter asks of the reporting service: the life of a session and its messages.
-// Operations are handed over in order and never block or fail; the caller does not own the client.
-// Used on the reporter's loop thread only.
+// The operations of the reporting service that the reporter uses: the life of a session, and its
+// messages. Calls only queue an operation: they keep their order, do not block and do not fail.
+// Belongs to the loop thread. Callers do not own the client.
 class ReportingClient {
  public:
   ReportingClient() = default;
@@ -23,7 +23,7 @@ class ReportingClient {
 
   virtual void createSession(ReporterID id) = 0;
   virtual void setServiceType(ReporterID id, ServiceType type) = 0;
-  // Merges into what the session's configuration already holds.
+  // Adds the entries to the session's configuration; entries with the same keys are replaced.
   virtual void setConfiguration(ReporterID id, const platform::Dictionary& configuration) = 0;
   virtual void start(ReporterID id) = 0;
   virtual void send(ReporterID id, const platform::Dictionary& message, Category category,

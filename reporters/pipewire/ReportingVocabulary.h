@@ -2,7 +2,9 @@
 
 #include "reporters/pipewire/ReportingClient.h"
 
-// The categories, types, service types and keys that this reporter uses.
+// The categories, types, service types and keys that this reporter uses. The numbers are those of
+// the service's wire interface. They stand here again because a client does not include the
+// service's headers.
 namespace halvox::pipewire_reporter {
 
 inline constexpr ServiceType kServiceGeneric = 0;
@@ -31,14 +33,15 @@ inline constexpr const char* kDevicesKey = "active_devices";
 inline constexpr const char* kVolumeKey = "RQSessionVolume";
 inline constexpr const char* kPlayingKey = "RQSessionVolumePlayingState";
 inline constexpr const char* kVolumeProcessKey = "RQSessionVolumeOperationProcess";
-// Tells the streams of one application apart: the stream's object.serial, in every message.
+// The stream's object.serial. In every message, to distinguish the streams of one application.
 inline constexpr const char* kSerialKey = "object_serial";
-// Counts the runs of one stream from 1, so that a second Start is not a repeat of the first.
+// The number of the stream's run, from 1. Without it the service would suppress a second Start as a
+// repeat of the first.
 inline constexpr const char* kRunKey = "run";
-// The stable names behind `kDevicesKey`, which is meant for people.
+// The stable node names of the devices; kDevicesKey has their descriptions, for people.
 inline constexpr const char* kDeviceNamesKey = "device_node_names";
 
-// An issue: what it is, the node and the application that had it, and what was not heard of it.
+// Keys of an issue: its type, the affected node and application, and how long nothing was heard.
 inline constexpr const char* kIssueTypeKey = "issue_type";
 inline constexpr const char* kIssueXrun = "xrun";
 inline constexpr const char* kNodeKey = "node";

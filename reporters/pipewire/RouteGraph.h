@@ -10,14 +10,14 @@
 
 namespace halvox::pipewire_reporter {
 
-// What PipeWire calls a global's ID: it is reused after the object has gone.
+// PipeWire's ID of a global object. The server uses it again after the object was removed.
 using GlobalID = std::uint32_t;
 
-// The devices that a stream is linked to, each once, ordered by name.
+// The devices that a stream is linked to: each once, sorted by name.
 struct Route {
   struct Device {
     std::string name;         // the stable node name
-    std::string description;  // for people; the name when there is none
+    std::string description;  // for people; the name if the node has none
     // The comparison hides a literal 0. NOLINTNEXTLINE(modernize-use-nullptr)
     friend auto operator<=>(const Device&, const Device&) = default;
   };
@@ -30,31 +30,32 @@ struct Link {
   GlobalID input = 0;
 };
 
-// Which nodes are linked to which, to find the devices behind a stream.
-// Belongs to one thread. Holds one entry per device and link that PipeWire has.
+// Keeps the devices and the links between nodes, to find the devices of a stream. Events may repeat
+// or name unknown objects. Holds one entry for each device and link of the server. A plain value
+// that belongs to the loop thread.
 class RouteGraph {
  public:
-  // Other streams are no devices: they are not to be added here.
+  // Do not add streams: a recorder that listens to a playback stream is not its device.
   void addDevice(GlobalID id, Route::Device device);
   void removeDevice(GlobalID id);
   void addLink(GlobalID id, Link link);
-  // The nodes that it linked; both 0 when there is no such link.
+  // Returns the nodes that the link connected; both are 0 if the link is unknown.
   Link removeLink(GlobalID id);
   void clear();
 
-  // Where a stream plays to or records from; empty while it is linked to no device.
+  // Returns the devices that a stream plays to or records from; empty while it has none.
   [[nodiscard]] Route routeOf(GlobalID stream, Direction direction) const;
 
  private:
-  // The nodes at the other end, each with the number of links to it (one a channel).
+  // The nodes at the other end, each with the number of links to it. Each channel has a link.
   using Peers = std::map<GlobalID, unsigned>;
   using PeerMap = std::unordered_map<GlobalID, Peers>;
   static void release(PeerMap& map, GlobalID from, GlobalID peer);
 
   std::unordered_map<GlobalID, Route::Device> devices_;
   std::unordered_map<GlobalID, Link> links_;
-  PeerMap sinks_;    // of an output node
-  PeerMap sources_;  // of an input node
+  PeerMap sinks_;    // by output node
+  PeerMap sources_;  // by input node
 };
 
 }  // namespace halvox::pipewire_reporter

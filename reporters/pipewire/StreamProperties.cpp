@@ -61,7 +61,7 @@ bool equalIgnoringCase(std::string_view left, std::string_view right) {
   return std::ranges::equal(left, right, {}, lowerCase, lowerCase);
 }
 
-// The first of those properties that has a text.
+// Returns the text of the first of these properties that is not empty.
 std::string firstText(const Properties& properties, std::initializer_list<const char*> keys) {
   for (const char* key : keys) {
     if (const auto text = property(properties, key); !text.empty()) {

@@ -10,23 +10,24 @@
 
 namespace halvox::pipewire_reporter {
 
-// The properties of a PipeWire object, as they came: any text under any key.
+// The properties of a PipeWire object as they were received: any text under any key.
 using Properties = std::map<std::string, std::string, std::less<>>;
 
 enum class Direction : std::uint8_t { kPlayback, kRecord };
 
-// The text under a key; empty when there is none.
+// Returns the text under a key; empty when there is none.
 std::string_view property(const Properties& properties, std::string_view key);
 
-// The service type that stands for a media role, whatever its letters' case.
-// No role is generic; a role that is not known is treated as short sound.
+// Returns the service type for a media role, ignoring case. An empty role is generic; an unknown
+// role counts as short sounds.
 ServiceType serviceTypeForRole(std::string_view role);
 
-// What a session tells about its stream, under the service's keys. Properties that are missing,
-// empty or, where a number is due, not a number are left out; texts are cleaned.
+// Makes the configuration of a stream's session. Omits properties that are missing or empty, and
+// numbers that do not parse. Texts are cleaned (see cleanText).
 platform::Dictionary makeConfiguration(const Properties& properties);
 
-// The name of the process behind a stream, or the next best name that its properties have.
+// Returns the name of a stream's process: its binary, else the name of the application, else the
+// name of the node, else "Unknown".
 std::string processName(const Properties& properties);
 
 }  // namespace halvox::pipewire_reporter

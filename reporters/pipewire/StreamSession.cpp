@@ -10,7 +10,7 @@ namespace {
 constexpr std::string_view kRoleProperty = "media.role";
 constexpr std::string_view kNodeProperty = "node.name";
 
-// The entries of `now` that `before` lacks or has otherwise.
+// Returns the entries of `now` that are new or differ from those of `before`.
 platform::Dictionary changedEntries(const platform::Dictionary& before,
                                     const platform::Dictionary& now) {
   platform::Dictionary changed;
@@ -156,7 +156,7 @@ void StreamSession::endRun() {
   if (const auto lost = xruns_.takeRest()) {
     sendXrun(*lost);
   }
-  // The volume first, so that its played time ends within the run.
+  // Send the volume before the Stop, so that the time played at this volume ends within the run.
   sendVolumeIfChanged();
   sendRun(kTypeStop);
 }
@@ -184,7 +184,7 @@ void StreamSession::sendVolumeIfChanged() {
     return;
   }
   sentVolume_ = state;
-  // PipeWire does not tell who turned a stream's volume, so it is put down to the stream's process.
+  // PipeWire does not say which process changed a volume. Name the stream's own.
   send({{kVolumeKey, state.volume},
         {kPlayingKey, state.playing ? 1 : 0},
         {kVolumeProcessKey, process_}},

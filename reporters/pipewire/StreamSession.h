@@ -13,13 +13,15 @@ namespace halvox::pipewire_reporter {
 
 // The reporting session of one stream.
 //
-//   made: session created, typed and configured
-//     └─ first run: session started ─┬─ runs: Start, volume (playing), xruns
-//                                    └─ idles: volume (not playing), Stop
-//   destroyed: as for idling if it runs; session stopped if it was started, then destroyed
+//   constructor: creates the session, sets its service type and configuration
+//     └─ first run: starts the session ─┬─ runs: sends Start, volume (playing), xruns
+//                                       └─ idles: sends volume (not playing), Stop
+//   destructor: as for idling if the stream runs; stops a started session; destroys the session
 //
-// What is told before the first run is kept and sent with the start. What is told again without a
-// change is sent once. Belongs to the loop thread; borrows the client, which must outlive it.
+// Format, route and volume that come before the first run are kept and sent with the start. A value
+// that has not changed is not sent again.
+// Owned by the StreamTracker; belongs to the loop thread. Does not own the client, which must
+// outlive it. Cannot fail: the client queues every operation.
 class StreamSession {
  public:
   struct Identity {
@@ -36,15 +38,15 @@ class StreamSession {
   void setProperties(const Properties& properties);
   void setRunning(bool running);
   void setFormat(const StreamFormat& format);
-  // An empty route is no news: a stream that is being moved has none for a moment.
+  // Ignores an empty route: a stream that is being moved has no device for a moment.
   void setRoute(const Route& route);
   void changeVolume(const VolumeChange& change);
-  // The stream missed the cycle of that time and length; reported by the next reportXruns() that is
-  // due.
+  // The stream missed the cycle that began at `cycle` and lasted `lost`. A later reportXruns()
+  // reports it.
   void addXrun(XrunMeter::Time cycle, XrunMeter::Seconds lost);
-  // Reports what the stream lost, at most once a second.
+  // Reports what the stream has lost, at most once a second.
   void reportXruns(XrunMeter::Time now);
-  // Says again what holds now; for a service that has lost what it was told.
+  // Sends format, route and volume again. For a service that restarted and has lost them.
   void restate();
 
   [[nodiscard]] Direction direction() const { return identity_.direction; }

@@ -108,7 +108,7 @@ void StreamTracker::cycleEnded(XrunMeter::Time time, XrunMeter::Seconds length,
       session->addXrun(time, length);
     }
   }
-  // Each cycle also brings what was held back before, so no timer is needed.
+  // Every cycle, of any node, also sends reports that are due by now. This saves a timer.
   for (auto& [id, entry] : streams_) {
     entry.session->reportXruns(time);
   }
@@ -120,7 +120,7 @@ StreamSession* StreamTracker::findStream(GlobalID id) {
 }
 
 void StreamTracker::addStream(const Node& node, Direction direction) {
-  // A removal that was never told; the old stream cannot be there any more.
+  // The server uses an ID again only after it removed the object, even if no removal was received.
   removeStream(node.id);
   const ReporterID reporterID = reporterIDFor(cookie_, node.serial);
   if (streams_.size() >= kMaxStreams || !reporterIDs_.insert(reporterID).second) {

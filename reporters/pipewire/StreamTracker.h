@@ -17,23 +17,26 @@
 
 namespace halvox::pipewire_reporter {
 
-// The direction of a stream node by its media class; nothing for any other node.
+// Returns the direction of a stream by the media class of its node; std::nullopt for other nodes.
 std::optional<Direction> streamDirection(std::string_view mediaClass);
 
-// The identifier of a stream's session: 0x5057 ("PW") in the upper 16 bits, then the lower 16 bits
-// of the PipeWire server's cookie, then the lower 32 bits of the stream's object.serial. All can be
-// read with `pw-cli info 0` and `pw-dump`. So identifiers are never 0, do not meet those of other
-// reporters, and streams of two servers (two users, or one server before and after its restart)
-// with equal serials differ by the cookie.
+// Makes the identifier of a stream's session: 0x5057 ("PW") in the upper 16 bits, then the lower 16
+// bits of the PipeWire server's cookie, then the lower 32 bits of the stream's object.serial. Users
+// can look the parts up with `pw-cli info 0` and `pw-dump`.
+//
+// The prefix keeps the identifier from being 0 and from colliding with those of other reporters.
+// The cookie distinguishes equal serials of two servers: of two users, or of one server before and
+// after its restart.
 ReporterID reporterIDFor(std::uint32_t serverCookie, std::uint64_t serial);
 
-// Turns what happens in PipeWire into reporting sessions: one for each stream node, while it
-// exists. Knows nothing of PipeWire's library; whoever watches PipeWire tells it the events, in
-// their order. Events about nodes that are not known, or are no streams, change nothing. Belongs to
-// the loop thread; borrows the client, which must outlive it. Its destruction ends all sessions.
+// Turns PipeWire's events into reporting sessions: each stream node has one while it exists. Does
+// not use PipeWire's library; PipeWireSource passes the events in their order. Ignores events about
+// unknown nodes and nodes that are not streams.
+// Belongs to the loop thread. Does not own the client, which must outlive it. The destructor ends
+// all sessions. Cannot fail: the client queues every operation.
 class StreamTracker {
  public:
-  // How many streams are followed at once; further ones are counted and left alone.
+  // The most streams at once. Further streams are counted and not followed.
   static constexpr std::size_t kMaxStreams = 4096;
 
   struct Node {
@@ -45,11 +48,12 @@ class StreamTracker {
 
   explicit StreamTracker(ReportingClient& client) : client_(client) {}
 
-  // A server is there; its objects follow.
+  // A server is connected. Its objects follow as events.
   void serverConnected(std::uint32_t cookie);
-  // The server and all its objects are gone: ends all sessions.
+  // The server and all its objects are gone. Ends all sessions.
   void serverLost();
-  // The reporting service came back without its history: each started session says how things are.
+  // The reporting service restarted and lost its history. Each started session sends its current
+  // state again.
   void serviceRestarted();
 
   void nodeAdded(const Node& node);
@@ -61,12 +65,12 @@ class StreamTracker {
   void streamRunningChanged(GlobalID id, bool running);
   void streamFormatChanged(GlobalID id, const StreamFormat& format);
   void streamVolumeChanged(GlobalID id, const VolumeChange& change);
-  // A driver of the server went through a cycle of that length, which those nodes missed.
+  // A driver of the server finished a cycle of `length`, and `lateNodes` missed it.
   void cycleEnded(XrunMeter::Time time, XrunMeter::Seconds length,
                   std::span<const GlobalID> lateNodes);
 
   [[nodiscard]] std::size_t streamCount() const { return streams_.size(); }
-  // Streams that got no session: too many, or with a serial that is taken.
+  // The number of streams without a session: too many, or another stream has the same identifier.
   [[nodiscard]] std::uint64_t refusedStreams() const { return refusedStreams_; }
 
  private:

@@ -17,7 +17,7 @@ inline constexpr GlobalID kStream = 20;
 inline constexpr std::uint32_t kCookie = 0xABCD1234;
 inline constexpr std::uint64_t kSerial = 55;
 
-// A tracker that knows two devices, and a client that records what it is told.
+// A fixture with a tracker that knows two devices, and a client that records its operations.
 class StreamTrackerTest : public testing::Test {
  protected:
   StreamTrackerTest() {
@@ -39,7 +39,7 @@ class StreamTrackerTest : public testing::Test {
                        .mediaClass = mediaClass,
                        .properties = std::move(properties)});
   }
-  // A stream that runs at half volume.
+  // Adds a stream that runs at half volume, and forgets the operations that this caused.
   void runStream() {
     addStream();
     setVolume(0.5F);

@@ -3,7 +3,7 @@
 
 #include "reporters/pipewire/StreamTrackerFixture.h"
 
-// What the tracker reports of cycles that a stream missed.
+// What the tracker reports about cycles that a stream missed.
 
 namespace halvox::pipewire_reporter {
 namespace {
@@ -20,7 +20,7 @@ class StreamTrackerXrunTest : public StreamTrackerTest {
     tracker.streamRunningChanged(kStream, true);
     client.forget();
   }
-  // A cycle of a quarter of a second that those nodes missed.
+  // Ends a cycle of a quarter of a second that these nodes missed.
   void cycle(Milliseconds time, const std::vector<GlobalID>& late) {
     tracker.cycleEnded(time, XrunMeter::Seconds(0.25), late);
   }
@@ -53,7 +53,7 @@ TEST_F(StreamTrackerXrunTest, FurtherOnesAreAddedUpToOneReportASecond) {
   }
   EXPECT_THAT(client.operations(), ElementsAre("playback-issue"));
 
-  cycle(Milliseconds(2000), {});  // nobody missed this one: it brings what was held back
+  cycle(Milliseconds(2000), {});  // no node missed this cycle, but earlier losses are now due
 
   EXPECT_THAT(client.operations(), ElementsAre("playback-issue", "playback-issue"));
   EXPECT_EQ(sentSilence(), 0.75);

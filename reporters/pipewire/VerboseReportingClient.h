@@ -9,7 +9,8 @@
 
 namespace halvox::pipewire_reporter {
 
-// Says each operation before handing it on. Borrows the client behind it.
+// Logs each operation, then passes it to another client, which it does not own and which must
+// outlive it. Belongs to the loop thread.
 class VerboseReportingClient final : public ReportingClient {
  public:
   using Log = std::function<void(std::string_view line)>;

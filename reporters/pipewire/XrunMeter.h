@@ -5,8 +5,8 @@
 
 namespace halvox::pipewire_reporter {
 
-// Adds up what one stream lost, and says when that is to be reported: at once, but not sooner than
-// a second after the report before. Of the loop thread; times are those of one clock.
+// Adds up what one stream lost, and decides when to report it: at once, but at most once a second.
+// A plain value that belongs to the loop thread. All times are of one clock.
 class XrunMeter {
  public:
   using Time = std::chrono::nanoseconds;
@@ -14,13 +14,13 @@ class XrunMeter {
 
   static constexpr std::chrono::seconds kDistance{1};
 
-  // The stream missed the cycle of that time and length. PipeWire's profiler tells of a missed
-  // cycle twice, one right after the other; the second time does not count.
+  // The stream missed the cycle that began at `cycle` and lasted `lost`. PipeWire's profiler
+  // reports a missed cycle twice in a row; the second report is ignored.
   void add(Time cycle, Seconds lost);
-  // What was lost since the last report, if there is any and a report is due. The clock may have
-  // been set back: then one is.
+  // Returns what was lost since the last report, if anything was and a report is due. A report is
+  // also due when the clock was set back, which would otherwise delay it for an unknown time.
   [[nodiscard]] std::optional<Seconds> takeDue(Time now);
-  // The same for a stream that ends: due or not.
+  // Returns what was lost since the last report, due or not. For a stream that ends.
   [[nodiscard]] std::optional<Seconds> takeRest();
 
  private:

@@ -43,9 +43,9 @@ void declareOptions(CLI::App& app, Arguments& arguments) {
          "service is there, else the system's, /run/halvox/reporting.sock)")
       ->type_name("PATH");
   app.add_option("--remote", arguments.remote, "The PipeWire server to follow")->type_name("NAME");
-  app.add_flag("--verbose", arguments.verbose, "Say each operation and message on standard error");
+  app.add_flag("--verbose", arguments.verbose, "Log each operation and message on standard error");
   app.add_flag("--no-xruns", arguments.noXruns,
-               "Do not watch for xruns, which wakes several times a second while streams run");
+               "Do not report xruns; saves several wake-ups a second while streams run");
   app.set_version_flag("--version", std::string("halvox-pipewire-reporter " HALVOX_VERSION));
 }
 
@@ -55,7 +55,8 @@ void logLosses(const halvox::client::Counters& counters, const StreamTracker& tr
                         counters.lost, counters.refused, counters.accepted + counters.dropped));
   }
   if (tracker.refusedStreams() > 0) {
-    logLine(fmt::format("streams left alone: {}", tracker.refusedStreams()));
+    logLine(fmt::format("{} streams were not followed: more than {} at once, or equal identifiers",
+                        tracker.refusedStreams(), StreamTracker::kMaxStreams));
   }
 }
 
@@ -83,6 +84,7 @@ void run(const Arguments& arguments) {
   client.setConnectionHandler([&client, serviceRestarted, wasLost = false](bool connected) mutable {
     logLine(connected ? "connected to the reporting service at " + client.socketPath()
                       : "the connection to the reporting service ended; waiting for it");
+    // The client library makes the sessions again, but does not repeat earlier messages.
     if (connected && wasLost) {
       serviceRestarted();
     }
@@ -102,8 +104,8 @@ void run(const Arguments& arguments) {
 
 int main(int count, char** texts) {
   CLI::App app(
-      "Gives each audio stream of a running PipeWire a reporting session.\n"
-      "Runs until SIGTERM or SIGINT; then its sessions are stopped and destroyed.");
+      "Reports each audio stream of a running PipeWire server as a session.\n"
+      "Runs until SIGTERM or SIGINT, then stops and destroys its sessions.");
   Arguments arguments;
   declareOptions(app, arguments);
   try {
