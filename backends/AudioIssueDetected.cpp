@@ -13,7 +13,7 @@ using platform::ProtoWriter;
 
 namespace {
 
-// The fields' numbers.
+// Field numbers.
 constexpr std::uint32_t kTimestamp = 1;
 constexpr std::uint32_t kDuration = 2;
 constexpr std::uint32_t kIssueType = 3;
@@ -80,7 +80,7 @@ bool AudioIssueDetected::readField(ProtoReader& reader, std::uint64_t number,
       setTimestamp(reader.readVarint());
       return true;
     case kDuration:
-      duration_ = static_cast<std::int32_t>(reader.readVarint());  // the low 32 bits
+      duration_ = static_cast<std::int32_t>(reader.readVarint());  // keeps the low 32 bits
       return true;
     case kIssueType:
       reader.readString(issueType_);

@@ -9,15 +9,16 @@
 
 namespace halvox::zubmetrics {
 
-// One audio issue as the diagnostics metrics know it. A plain value of one thread.
+// The protocol-buffers message of one audio issue, as the diagnostics metrics receive it. A plain
+// value: one thread at a time may use it.
 class AudioIssueDetected final : public platform::ProtoBase {
  public:
   AudioIssueDetected() = default;
   ~AudioIssueDetected() override = default;
   AudioIssueDetected(const AudioIssueDetected& other) = default;
-  // Leaves its texts empty and its timestamp absent.
+  // Leaves `other` with empty texts and without a timestamp.
   AudioIssueDetected(AudioIssueDetected&& other) noexcept;
-  // Leaves this message as it was when copying fails.
+  // Leaves this message unchanged if copying throws.
   AudioIssueDetected& operator=(const AudioIssueDetected& other);
   AudioIssueDetected& operator=(AudioIssueDetected&& other) noexcept;
   friend void swap(AudioIssueDetected& left, AudioIssueDetected& right) noexcept;
@@ -31,22 +32,25 @@ class AudioIssueDetected final : public platform::ProtoBase {
   void setNode(std::string_view node) { node_ = node; }
   void setRtaidClient(std::string_view rtaidClient) { rtaidClient_ = rtaidClient; }
   void setTimestamp(std::uint64_t timestamp);
-  // The timestamp is absent from now on, whatever it was.
+  // Makes the timestamp absent. The stored value stays but no longer counts.
   void clearTimestamp() { present_ &= ~kTimestampPresent; }
   void setDuration(std::int32_t duration) { duration_ = duration; }
 
-  // Adds what the bytes have to what the message has. Fields are known by their numbers alone, so a
-  // value of another wire type is read as the field's own; unknown fields are skipped. The end of a
-  // group that was not begun ends the message without an error.
+  // Merges the encoded fields into this message. Skips unknown fields. Returns false when the bytes
+  // end within a field or a field cannot be skipped; fields before the error keep their new values.
+  //
+  // Two rules look like mistakes and are required: the wire type of a known field is not checked,
+  // and a stray end-of-group tag ends the message without an error.
   [[nodiscard]] bool readFrom(platform::ProtoReader& reader) override;
-  // All fields but an absent timestamp, in the order of their numbers.
+  // Writes the fields in the order of their numbers, empty ones included; only an absent timestamp
+  // is omitted.
   void writeTo(platform::ProtoWriter& writer) const override;
-  // The fields in alphabetical order, without an absent timestamp.
+  // Formats the fields in alphabetical order and omits an absent timestamp.
   void formatText(platform::ProtoTextFormatter& formatter, const char* name) const override;
 
-  // Equal fields; an absent timestamp equals only an absent one.
+  // Compares all fields. Absent timestamps are equal, whatever value is stored.
   bool operator==(const AudioIssueDetected& other) const;
-  // The same for equal messages, in every run of every program.
+  // Returns a hash that is the same for equal messages in every program and every run.
   [[nodiscard]] std::uint64_t hash_value() const;
 
  private:

@@ -29,7 +29,7 @@ Bytes written(const AudioIssueDetected& issue) {
   return bytes;
 }
 
-// Adds the bytes to the message; whether they were read without an error.
+// Merges the bytes into the message. Returns true if there was no error.
 bool readInto(AudioIssueDetected& issue, const Bytes& bytes) {
   ProtoReader reader(std::as_bytes(std::span(bytes)));
   return issue.readFrom(reader);
@@ -143,7 +143,7 @@ TEST(AudioIssueDetectedTest, AssigningAMessageToItselfChangesNothing) {
   EXPECT_EQ(issue, fullIssue());
 }
 
-// Texts that fit into the string object and texts that do not move in different ways.
+// Tests short and long texts: std::string moves those within the object in a different way.
 TEST(AudioIssueDetectedTest, AMovedFromMessageHasNoTextsAndNoTimestamp) {
   for (const std::string& node : {std::string("mixer"), std::string(100, 'n')}) {
     AudioIssueDetected first = fullIssue();
@@ -152,7 +152,7 @@ TEST(AudioIssueDetectedTest, AMovedFromMessageHasNoTextsAndNoTimestamp) {
 
     AudioIssueDetected second(std::move(first));
     EXPECT_EQ(second, original);
-    // NOLINTNEXTLINE(bugprone-use-after-move): what is left is what is tested
+    // NOLINTNEXTLINE(bugprone-use-after-move): the test is about the moved-from state
     EXPECT_EQ(first.issueType() + first.node() + first.rtaidClient(), "");
     EXPECT_EQ(first.timestamp(), std::nullopt);
 
@@ -204,7 +204,7 @@ TEST(AudioIssueDetectedTest, ATimestampOfZeroIsWritten) {
 
 // --- Reading ------------------------------------------------------------------------------------
 
-TEST(AudioIssueDetectedTest, NoBytesAreAMessageThatChangesNothing) {
+TEST(AudioIssueDetectedTest, ReadingNoBytesChangesNothing) {
   AudioIssueDetected issue = fullIssue();
 
   EXPECT_TRUE(readInto(issue, {}));
@@ -225,7 +225,7 @@ TEST(AudioIssueDetectedTest, UnknownFieldsOfEveryWireTypeAreSkipped) {
   const AudioIssueDetected issue = readOrFail({
       0x30, 0x96, 0x01,                       // varint
       0x39, 1,    2,    3,    4, 5, 6, 7, 8,  // 64 bits
-      0x42, 2,    0x10, 0x63,                 // bytes that would be a duration
+      0x42, 2,    0x10, 0x63,                 // bytes that look like a duration
       0x4B, 0x10, 0x63, 0x4C,                 // a group with a duration of its own
       0x55, 1,    2,    3,    4,              // 32 bits
       0x10, 0x0C,
@@ -266,7 +266,7 @@ TEST(AudioIssueDetectedTest, FieldsBeforeAnErrorKeepTheirNewValues) {
   EXPECT_EQ(issue.node(), "mixer");
 }
 
-TEST(AudioIssueDetectedTest, ATimestampCutOffIsThereWithTheValueZero) {
+TEST(AudioIssueDetectedTest, ATruncatedTimestampIsPresentWithTheValueZero) {
   AudioIssueDetected issue;
 
   EXPECT_FALSE(readInto(issue, {0x08, 0x85}));
@@ -280,7 +280,7 @@ TEST(AudioIssueDetectedTest, ATagThatRunsLongerThanTenBytesIsFieldZeroAndSkipped
   EXPECT_EQ(readOrFail(bytes).duration(), 12);
 }
 
-// Between two fields a cut leaves a shorter message; anywhere else it is an error.
+// A cut between two fields leaves a shorter message; any other cut is an error.
 TEST(AudioIssueDetectedTest, ACutAtEveryByteIsAnErrorExceptBetweenFields) {
   const Bytes whole = written(fullIssue());
   const std::vector<std::size_t> ends{0, 3, 5, 13, 20, 23};
@@ -320,7 +320,7 @@ TEST(AudioIssueDetectedTest, TheTextHasTheFieldsInAlphabeticalOrder) {
             "}\n");
 }
 
-TEST(AudioIssueDetectedTest, TheTextLeavesOutAnAbsentTimestampOnly) {
+TEST(AudioIssueDetectedTest, TheTextOmitsOnlyAnAbsentTimestamp) {
   EXPECT_EQ(textOf({}),
             "issue {\n  duration: 0\n  issuetype: \"\"\n  node: \"\"\n  rtaidclient: \"\"\n}\n");
 }

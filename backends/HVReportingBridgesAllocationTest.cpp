@@ -18,7 +18,7 @@ TEST(HVReportingBridgesAllocationTest, MessagesThatConcernNoBridgeAllocateNothin
   const auto session = std::make_shared<HVReportingSession>(
       ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
   HVReportingUtilityVEKStateManager manager;
-  // With all the keys of the bridges: only the type keeps it from them.
+  // Has the keys of all bridges, so that only the type makes them ignore it.
   const platform::Message message = platform::Dictionary{
       {"EngineOnTime", 1}, {"Haptic_Active_Hardware_Time_Seconds", 2}, {"issue_type", "a"}};
   constexpr auto kCategory = AudioEventCategory::kPlayback;

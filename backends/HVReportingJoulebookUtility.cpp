@@ -49,7 +49,8 @@ Dictionary enginePayload(const Dictionary& message, const Value& onTime,
   Dictionary payload;
   payload.set(duration, onTime);
   const Value appName = HVReportingUtilityRetrieveAppName(session.configuration());
-  if (appName != Value()) {  // as it always is: there is a substitute for none
+  // Always true, since the name defaults to "Unknown". The test and its line are required anyway.
+  if (appName != Value()) {
     payload.set(application, appName);
   } else {
     kLog.error("failed to get app name for joulebook");

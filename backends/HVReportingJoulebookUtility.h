@@ -9,16 +9,16 @@ namespace halvox {
 
 class HVReportingSession;
 
-// Hands what costs energy to the power log: how long a haptics engine was on, and haptics sessions
-// that were left running. Keeps no state; any thread. Reports no failure: what an engine report
-// lacks is logged, and left out.
+// Forwards reports about energy use to the power log: how long a haptics engine was on, and haptics
+// sessions that were left running ("leaked"). Keeps no state; any thread may call. Returns no
+// error: a key that an engine report lacks is logged and omitted from the event.
 class HVReportingJoulebookUtility {
  public:
   HVReportingJoulebookUtility() = delete;
 
-  // Logs at most one power event for a message of type kJoulebook of a session, which is not null:
-  // of the engine when the message tells of both. Does nothing for any other message, or for none.
-  // The category does not matter. Values reach the power log as they came.
+  // Logs at most one power event for a message of type kJoulebook. If a message reports both, the
+  // engine takes precedence. Ignores messages of other types and a missing message. Does not use
+  // the category. Values reach the power log unchanged. `session` must not be null.
   static void handleEvent(const platform::Message& message, AudioEventCategory category,
                           AudioEventType type, const std::shared_ptr<HVReportingSession>& session);
 };

@@ -105,7 +105,7 @@ TEST_F(HVReportingJoulebookUtilityTest, TheEngineComesBeforeTheLeak) {
               ElementsAre(testing::Field(&Event::name, "Oxbow_Haptics")));
 }
 
-// Whatever a client sends under the keys: a text stays a text, a container is shared.
+// A client may send any type of value under the keys: a text stays a text, a container is shared.
 TEST_F(HVReportingJoulebookUtilityTest, ValuesReachTheLogAsTheyCame) {
   const Dictionary nested{{"x", 1}};
   handle(Dictionary{{"EngineOnTime", nested}, {"hvreporting_timestamp", "late"}});

@@ -19,7 +19,8 @@ using platform::Message;
 
 namespace {
 
-// An event's name, put together without allocation: most names are only asked for, never sent.
+// Joins the parts of an event name without an allocation: every message makes two names, and most
+// of them are only tested, never sent.
 class EventName {
  public:
   EventName(std::initializer_list<std::string_view> parts) {
@@ -30,7 +31,8 @@ class EventName {
   [[nodiscard]] std::string_view text() const { return {text_.data(), length_}; }
 
  private:
-  // The longest name, of PlaybackAndRecord and HeadphoneAudioExposure, has 75 characters.
+  // The longest name, with PlaybackAndRecord and HeadphoneAudioExposure, has 75 characters. A name
+  // that does not fit would be cut: check this size when a text is added to the vocabulary.
   std::array<char, 128> text_;
   std::size_t length_ = 0;
 };

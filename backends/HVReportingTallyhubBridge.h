@@ -9,17 +9,19 @@ namespace halvox {
 
 class HVReportingSession;
 
-// Hands each message to the analytics service as up to two events, one named from the message's
-// category and type and one from the session's service as well. Keeps no state; any thread.
-// Reports no failure: a name that nobody collects is not sent.
+// Forwards each message to the analytics service as up to two events. One is named after the
+// message's category and type, the other also after the session's service. Keeps no state; any
+// thread may call. Returns no error; an event that nobody collects is not sent.
 class HVReportingTallyhubBridge {
  public:
   HVReportingTallyhubBridge() = delete;
 
-  // Sends the events of one message of a session, which is not null. The payload is the message
-  // (an empty one when there is none) with the application's name as the session's configuration
-  // has it when the payload is built; that may be later and on another thread, so the events hold
-  // the message and the session. Takes every category and type. Never changes the message.
+  // Sends the events of one message, of any category and type. `session` must not be null.
+  //
+  // The payload is a copy of the message (empty without a message) with the name of the application
+  // from the session's configuration. The analytics service builds it later, possibly on another
+  // thread, so each event holds the message and the session, and a configuration that changed
+  // meanwhile is seen in its new state.
   static void handleEvent(const platform::Message& message, AudioEventCategory category,
                           AudioEventType type, const std::shared_ptr<HVReportingSession>& session);
 };

@@ -13,7 +13,7 @@
 namespace halvox {
 namespace {
 
-// Nobody collects anything, and asking costs nothing.
+// Collects no event and does not allocate to say so.
 class UnusedAnalyticsService final : public platform::AnalyticsService {
  public:
   bool isAnalyticsEventUsed(std::string_view /*eventName*/) override {

@@ -11,56 +11,61 @@
 #include "platform/process.h"
 #include "platform/value.h"
 
-// The stateless functions that all components share. Any thread may call them; none blocks but
-// HVReportingUtilityWait, and none reports an error: what is unknown has a stated substitute.
+// Stateless functions that all components share. Any thread may call them. Only
+// HVReportingUtilityWait blocks. None reports an error: each states its substitute for unknown
+// values. Wait, Signal, IsABTestModeOn, ExtractSessionIDFromReporterID and RoundWithPlaces have no
+// caller but their tests. They are required all the same: do not remove them.
 namespace halvox {
 
 // --- Texts of the vocabulary --------------------------------------------------------------------
 
-// The two parts of a category's text, for callers that join it to more: nothing is allocated. The
-// domain's part ends with "_", or is empty. Both live as long as the process.
+// The two parts of a category's text, for callers that append them without an allocation. `domain`
+// is empty or ends with "_". Both live as long as the process.
 struct HVReportingCategoryText {
   std::string_view domain;
   std::string_view name;
 };
 HVReportingCategoryText HVReportingUtilityCategoryTextParts(AudioEventCategory category);
 
-// The text of a category, made anew: "Session_Playback". A high half that is no single domain gives
-// "_" alone before the name; a low half that is no category is "Undefined".
+// Returns the text of a category, such as "Session_Playback". If the high half is not exactly one
+// domain, only "_" precedes the name. If the low half is not a category, the name is "Undefined".
 std::string HVReportingUtilityCategoryString(AudioEventCategory category);
 
-// The text of a type; "Generic" for every value without one. Lives as long as the process.
+// Returns the text of a type; "Generic" for unlisted values. Lives as long as the process.
 std::string_view HVReportingUtilityTypeString(AudioEventType type);
-// The same for a type that was widened.
+// The same for a type widened to 32 bits: values above 65535 are unlisted, not truncated.
 std::string_view HVReportingUtilityTypeString(std::uint32_t type);
 
-// The name of a service; "telephony" for every value without one. Lives as long as the process.
+// Returns the name of a service. Lives as long as the process. Unlisted values are "telephony",
+// which is deliberate.
 std::string_view HVReportingUtilityGenerateServiceNameFromServiceType(AudioServiceType serviceType);
-// The service of that very name; kUnknown for any other text and for none.
+// Returns the service of a name, which is case-sensitive; kUnknown for any other text or none.
 AudioServiceType HVReportingUtilityGenerateServiceTypeFromServiceName(
     std::optional<std::string_view> serviceName);
 
 // --- Decisions ----------------------------------------------------------------------------------
 
-// Whether a message that is due goes out at all: always.
+// Returns whether messages are sent at all. Always true; callers ask all the same.
 bool HVReportingUtilityShouldSendMessage();
-// Whether sessions may send through their open link: always.
+// Returns whether sessions may send through an open link. Always true; callers ask all the same.
 bool HVReportingUtilityAllowSessionTransactions();
-// Whether the link may collect a service's messages: all but those of kAPIUsage.
+// Returns whether the link may batch the messages of a service: all services but kAPIUsage.
 bool HVReportingUtilityShouldBatchTLMReportingEventsForServiceType(AudioServiceType serviceType);
-// Whether the category has anything in its high half; 0xFFFFFFFF does not count.
+// Returns whether the category has any bit in its high half. 0xFFFFFFFF is an exception: false.
 bool HVReportingUtilityIsABTestModeOn(AudioEventCategory category);
-// The category without its domain.
+// Returns the category without its domain.
 std::uint16_t HVReportingUtilityRetrieveTLMReportingCategoryFromCategory(
     AudioEventCategory category);
+// Returns the reporter ID unchanged.
 std::int64_t HVReportingUtilityExtractSessionIDFromReporterID(ReporterID reporterID);
-// How many seconds a volume must be held to be reported.
+// Returns the time in seconds that a volume must be held to be reported.
 double HVReportingUtilityVolumeMinimumPlayingTime(AudioServiceType serviceType);
 
 // --- Device and processes -----------------------------------------------------------------------
 
-// Asks once, at the first call, whether this device runs an internal build, and remembers the
-// answer; no answer, or one that is no boolean, means that it does not. Any thread may ask.
+// Queries once, at the first call, whether this device runs an internal build, and keeps the
+// answer. No answer, or one that is not a boolean, means no. Any thread may call; concurrent first
+// calls query the device once. A class so that tests can have an answer of their own.
 class HVReportingInternalBuildAnswer {
  public:
   bool isInternalBuild();
@@ -70,52 +75,57 @@ class HVReportingInternalBuildAnswer {
   bool internalBuild_ = false;  // written under once_ only
 };
 
-// The answer of this process, asked for once.
+// Returns the answer of this process.
 bool HVReportingUtilityIsInternalBuild();
 
-// Reads what the platform knows of a process into `record`. False, with `record` left alone, when
-// there is no such process.
+// Reads the platform's record of a process into `record`. Returns false, and does not change
+// `record`, when there is no such process.
 bool HVReportingUtilityProcessInfoForPID(platform::ProcessID pid, platform::ProcessRecord& record);
-// The command name of a process, or this process's own name; none when there is no such process.
+// Returns the command name of a process, or the own name of this process; std::nullopt when there
+// is no such process.
 std::optional<std::string> HVReportingUtilityProcessNameForPID(platform::ProcessID pid);
 
 // --- Messages -----------------------------------------------------------------------------------
 
-// The value under "HostApplicationDisplayID" of a message or configuration, or "Unknown".
+// Returns the value under "HostApplicationDisplayID" of a message or configuration, or "Unknown".
 platform::Value HVReportingUtilityRetrieveAppName(const platform::Dictionary& dictionary);
-// A copy whose "audiotag" is the category's text and the type's, joined without a separator.
+// Returns a copy whose "audiotag" is the text of the category followed by that of the type, without
+// a separator. Replaces an "audiotag" that is there.
 platform::Dictionary HVReportingUtilityAddAudioMessageTag(const platform::Dictionary& dictionary,
                                                           AudioEventCategory category,
                                                           AudioEventType type);
-// A copy with "_" for each blank in its keys; of keys that become equal the later one's value is
-// kept. Costs next to nothing when there is no blank.
+// Returns a copy whose keys have "_" in place of each blank (U+0020 only). If two keys become
+// equal, the later value is kept. Without blanks the result shares the input's entries: nothing is
+// copied.
 platform::Dictionary HVReportingUtilityRemoveWhiteSpaceFromKeys(
     const platform::Dictionary& dictionary);
 
 // --- Numbers ------------------------------------------------------------------------------------
 
-// Rounds to that many decimal places, halves away from zero; negative places round to tens and so
-// on.
+// Rounds to `places` decimal places, halves away from zero. Negative places round to tens, hundreds
+// and so on.
 double HVReportingUtilityRoundWithPlaces(double value, std::int32_t places);
-// The bucket nearest to the number, as a decimal text with at most that many fraction digits (with
-// one at least, unless none are allowed), rounded half to even. Walks the buckets, which are sorted
-// either way, until they get farther away; of two equally near the later wins. None without
-// buckets.
+// Returns the bucket nearest to the number as a decimal text; std::nullopt without buckets. The
+// text has at most `fractionDigits` fraction digits, rounded half to even, and at least one unless
+// `fractionDigits` is 0.
+//
+// The buckets must be sorted, in either direction: the search stops at the first bucket that is
+// farther away than the one before. Of two equally near buckets the later is chosen.
 std::optional<std::string> HVReportingUtilityBucketNumberToString(
     const platform::Value& number, const platform::Array& buckets,
     const platform::Value& fractionDigits);
 
 // --- Waiting ------------------------------------------------------------------------------------
 
-// What a one-shot event is guarded by. Its lock guards the event's flag too.
+// Guards a one-shot event. The mutex also guards the event's flag.
 struct HVReportingUtilityCondition {
   std::mutex mutex;
   std::condition_variable condition;
 };
 
-// Waits until the flag is set; false when that takes longer than the time-out, which begins anew at
-// each wake-up. Logs to `logCategory`: `waitingMessage` and "continuing" at info level,
-// `timeoutMessage` at error level. Blocks.
+// Blocks until the flag is set. Returns false on a time-out. Each wake-up restarts the time-out, so
+// a spurious wake-up grants a full one, which is required. Logs to `logCategory`: `waitingMessage`
+// and "continuing" at info level, `timeoutMessage` at error level.
 bool HVReportingUtilityWait(HVReportingUtilityCondition& condition, double timeoutSeconds,
                             const bool* flag, std::string_view waitingMessage,
                             std::string_view timeoutMessage, platform::LogCategory& logCategory);

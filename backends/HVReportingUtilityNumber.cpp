@@ -12,10 +12,11 @@ using platform::Value;
 
 namespace {
 
-// The number in decimal digits without an exponent: all of an integer, and of a binary fraction the
-// fewest digits that tell it from its neighbours, which are those that it was written with.
+// Returns the number in decimal digits without an exponent: all digits of an integer, and the
+// shortest digits of a fraction that read back as the same number. 0.35 thus rounds as "0.35", as
+// its writer expects, and not as the slightly smaller binary value.
 std::string plainDecimal(const Value& number) {
-  // The longest are the smallest doubles: a sign, "0.", 323 zeros and 17 digits.
+  // The longest text is that of the smallest doubles: a sign, "0.", 323 zeros and 17 digits.
   std::array<char, 400> buffer;
   char* const begin = buffer.data();
   char* const end = begin + buffer.size();
@@ -44,7 +45,7 @@ std::string plainDecimal(const Value& number) {
   return {begin, written.ptr};
 }
 
-// Adds one to the last digit of a decimal text, carrying on to the left.
+// Adds one to the last digit of a decimal text and carries to the left.
 void incrementLastDigit(std::string& decimal) {
   for (std::size_t at = decimal.size(); at > 0; --at) {
     char& digit = decimal[at - 1];
@@ -59,7 +60,7 @@ void incrementLastDigit(std::string& decimal) {
   decimal.insert(decimal.front() == '-' ? 1 : 0, 1, '1');
 }
 
-// Cuts a decimal text with a point down to that many fraction digits, rounding half to even.
+// Shortens a decimal text with a point to `digits` fraction digits, rounding half to even.
 void roundFraction(std::string& decimal, std::size_t point, std::size_t digits) {
   const std::size_t cut = point + 1 + digits;
   if (cut >= decimal.size()) return;
@@ -77,14 +78,15 @@ std::string formatBucket(const Value& bucket, std::uint64_t fractionDigits) {
   std::string decimal = plainDecimal(bucket);
   const std::size_t point = decimal.find('.');
   if (point != std::string::npos) {
-    // More digits than a text has change nothing.
+    // More digits than the text has change nothing. The bound prevents an overflow when
+    // roundFraction() adds them to a position.
     const auto digits = static_cast<std::size_t>(
         std::min<std::uint64_t>(fractionDigits, std::uint64_t{decimal.size()}));
     roundFraction(decimal, point, digits);
   }
   const std::size_t keptPoint = decimal.find('.');
   if (keptPoint == std::string::npos) return fractionDigits == 0 ? decimal : decimal + ".0";
-  // Of the zeros that rounding left behind, one fraction digit stays.
+  // Remove trailing zeros, but keep one fraction digit.
   const std::size_t lastDigit = std::max(decimal.find_last_not_of('0'), keptPoint + 1);
   decimal.resize(lastDigit + 1);
   return decimal;

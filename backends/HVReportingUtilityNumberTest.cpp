@@ -14,12 +14,12 @@ namespace {
 using platform::Array;
 using platform::Value;
 
-// The bucket of `number`, or "none".
+// Returns the bucket of `number`, or "none".
 std::string bucket(const Value& number, const Array& buckets, const Value& digits) {
   return HVReportingUtilityBucketNumberToString(number, buckets, digits).value_or("none");
 }
 
-// One bucket is always chosen, so this shows how it is written.
+// A single bucket is always chosen, so this returns how it is formatted.
 std::string written(const Value& only, const Value& digits) { return bucket(0, {only}, digits); }
 
 // --- Rounding -----------------------------------------------------------------------------------
@@ -48,7 +48,7 @@ TEST(HVReportingUtilityRoundWithPlacesTest, RoundedNumbersStayAsTheyAre) {
   }
 }
 
-TEST(HVReportingUtilityRoundWithPlacesTest, NoNumberStaysNoNumber) {
+TEST(HVReportingUtilityRoundWithPlacesTest, NaNStaysNaN) {
   EXPECT_TRUE(std::isnan(HVReportingUtilityRoundWithPlaces(std::nan(""), 2)));
 }
 
@@ -91,8 +91,8 @@ TEST(HVReportingUtilityBucketTest, DistancesAreThoseOfDoublesWhateverTheNumbersA
   EXPECT_EQ(bucket(0.9, {0.5, 1, 2}, 1), "1.0");
 }
 
-TEST(HVReportingUtilityBucketTest, ANumberThatIsNoneTakesTheLastBucket) {
-  // Its distance is never farther than another.
+TEST(HVReportingUtilityBucketTest, NaNTakesTheLastBucket) {
+  // Comparing its distance with another is always false.
   EXPECT_EQ(bucket(std::nan(""), {0, 10, 20}, 0), "20");
 }
 
@@ -151,7 +151,7 @@ TEST(HVReportingUtilityBucketTest, OtherFractionsAreRoundedToTheNearest) {
   EXPECT_EQ(written(2.49, 0), "2");
 }
 
-TEST(HVReportingUtilityBucketTest, RoundingUpCarriesOn) {
+TEST(HVReportingUtilityBucketTest, RoundingUpCarriesToTheLeft) {
   EXPECT_EQ(written(9.96, 1), "10.0");
   EXPECT_EQ(written(99.5, 0), "100");
   EXPECT_EQ(written(-99.9, 0), "-100");
@@ -182,7 +182,7 @@ TEST(HVReportingUtilityBucketTest, FractionDigitsAreReadAsAnUnsignedInteger) {
   EXPECT_EQ(written(0.123, std::uint8_t{2}), "0.12");
 }
 
-TEST(HVReportingUtilityBucketTest, WhatIsNoNumberIsWrittenAsSuch) {
+TEST(HVReportingUtilityBucketTest, NaNAndInfinityAreWrittenAsSuch) {
   EXPECT_EQ(written(std::nan(""), 2), "nan");
   EXPECT_EQ(written(std::numeric_limits<double>::infinity(), 2), "inf");
 }

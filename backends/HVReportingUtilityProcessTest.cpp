@@ -80,10 +80,10 @@ TEST_F(HVReportingInternalBuildAnswerTest, ConcurrentFirstCallsAskTheDeviceOnce)
   EXPECT_EQ(platform_.deviceProperties.queries(), 1U);
 }
 
-// The answer of the process can be given once only, so each of these runs in a process of its own.
-// No test may call the function in the test program itself.
+// A process gets its answer only once, so each of these tests runs in a process of its own. No test
+// may call the function in the test program itself.
 
-// Exits with a sum: 1 when the first answer was yes, 2 when the second was, 4 for each query.
+// Exits with a sum: 1 if the first answer was yes, 2 if the second was, and 4 for each query.
 [[noreturn]] void exitWithAnswers(bool before, bool after) {
   FakePlatform platform;
   platform.deviceProperties.set("InternalBuild", before);

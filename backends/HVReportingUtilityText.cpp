@@ -33,7 +33,7 @@ constexpr std::array<std::string_view, 19> kTypeNames = {
     "Summary",
     "HeadphoneAudioExposure",
     "AudioExposure",
-    "Listeningenhancement",  // the lower-case e is part of the event names that are collected
+    "Listeningenhancement",  // the lower-case e is intended: event names contain it
     "Dorvan",
     "Simple",
     "Histogram",
@@ -51,7 +51,8 @@ bool hasHighHalf(AudioEventCategory category) {
   return value >= kFirstWithHighHalf && value <= kLastWithHighHalf;
 }
 
-// The domain's text with "_" behind it; "_" alone for bits that are no single domain.
+// Returns the text of a domain followed by "_", or "_" alone for bits that are not exactly one
+// domain.
 std::string_view domainText(AudioEventCategory domain) {
   switch (domain) {
     case AudioEventCategory::kMIDI:
@@ -66,7 +67,7 @@ std::string_view domainText(AudioEventCategory domain) {
       return "Routing_";
     case AudioEventCategory::kToolbox:
       return "Toolbox_";
-    default:  // clients may set any bits
+    default:  // reached: clients may set any bits
       return "_";
   }
 }
@@ -105,7 +106,7 @@ std::string_view HVReportingUtilityGenerateServiceNameFromServiceType(
   if (serviceType == AudioServiceType::kUnknown) return kUnknownServiceName;
   const auto value = static_cast<std::size_t>(serviceType);
   if (value < kServiceNames.size()) return kServiceNames[value];
-  // Kept: values without a name of their own count as telephony.
+  // Unlisted values are deliberately telephony, not unknown.
   return kServiceNames[static_cast<std::size_t>(AudioServiceType::kTelephony)];
 }
 
@@ -113,7 +114,7 @@ AudioServiceType HVReportingUtilityGenerateServiceTypeFromServiceName(
     std::optional<std::string_view> serviceName) {
   if (!serviceName.has_value()) return AudioServiceType::kUnknown;
   const auto* const found = std::ranges::find(kServiceNames, *serviceName);
-  if (found == kServiceNames.end()) return AudioServiceType::kUnknown;  // "unknown" itself, too
+  if (found == kServiceNames.end()) return AudioServiceType::kUnknown;  // includes "unknown" itself
   return static_cast<AudioServiceType>(found - kServiceNames.begin());
 }
 
@@ -137,7 +138,7 @@ std::int64_t HVReportingUtilityExtractSessionIDFromReporterID(ReporterID reporte
 }
 
 double HVReportingUtilityVolumeMinimumPlayingTime(AudioServiceType /*serviceType*/) {
-  constexpr double kSeconds = 0.5;  // the same for every service
+  constexpr double kSeconds = 0.5;  // for every service
   return kSeconds;
 }
 

@@ -20,9 +20,9 @@ namespace {
 constexpr platform::UnitLog kLog(&HVReportingVEKLogCategory, "HVReportingUtilityVEKStateManager");
 
 constexpr std::string_view kSignatureDomain = "Acoustat";
-// How many reports are counted before the one that brings a snapshot.
+// The number of counted reports at which the next one causes a snapshot.
 constexpr std::uint64_t kReportsBeforeSnapshot = 1;
-// The capture is of the state as it is, not of what is still to come.
+// The snapshot captures the present state, not a period to come.
 constexpr double kSnapshotSeconds = 0;
 
 // received = delivered (to the bug-capture service) + suppressed.
@@ -98,7 +98,7 @@ HVReportingUtilityVEKStateManager::Reporter HVReportingUtilityVEKStateManager::a
   return ailmentReporter_;
 }
 
-// What was there before is destroyed without the lock.
+// The parameter takes the old reporter, which is thus destroyed after the lock is released.
 void HVReportingUtilityVEKStateManager::setAilmentReporter(Reporter reporter) {
   const std::lock_guard held(mutex_);
   std::swap(ailmentReporter_, reporter);

@@ -17,15 +17,16 @@ namespace halvox {
 
 class HVReportingSession;
 
-// Counts distinct reports of haptics sessions that were left running, and at the second one asks
-// the bug-capture service for a snapshot and begins anew. A repeat of the counted report does not
-// count; the report that brought the snapshot is not remembered.
+// Counts distinct reports of haptics sessions that were left running. At the second distinct report
+// it requests a snapshot from the bug-capture service and starts again. A repeat of the counted
+// report is ignored. The report that caused the snapshot is deliberately not remembered: when it
+// comes again, it counts as a first report.
 //
 //   nothing counted --first report--> one counted --another report--> snapshot, nothing counted
 //
-// Each property may be read and written from any thread, but reports belong to one serial queue:
-// nothing holds a lock from reading the state to changing it. Held by the service's delegate.
-// Reports no failure: what became of a snapshot is only logged.
+// Each property may be read and written on any thread. handleEvent() must be called on one serial
+// queue: it holds no lock between reading the state and changing it. Owned by the service's
+// delegate. Returns no error: the outcome of a snapshot is only logged.
 class HVReportingUtilityVEKStateManager {
  public:
   using Reporter = std::shared_ptr<platform::AILDiagnosticReporter>;
@@ -34,19 +35,20 @@ class HVReportingUtilityVEKStateManager {
   HVReportingUtilityVEKStateManager(const HVReportingUtilityVEKStateManager&) = delete;
   HVReportingUtilityVEKStateManager& operator=(const HVReportingUtilityVEKStateManager&) = delete;
 
-  // Takes a message of a session, which is not null, that a process of that name sent. Does nothing
-  // unless it is of type kJoulebook and tells of a session left running. Never waits.
+  // Handles a message that the process `processName` sent through `session`, which must not be
+  // null. Ignores messages that do not report a session left running (type kJoulebook with the
+  // active time). Does not block: the reply of the snapshot comes later, on another thread.
   void handleEvent(const platform::Message& message, AudioEventCategory category,
                    AudioEventType type, const std::shared_ptr<HVReportingSession>& session,
                    std::string_view processName);
 
-  // Distinct reports since the last snapshot.
+  // The number of distinct reports since the last snapshot.
   [[nodiscard]] std::uint64_t leakedHapticsSessionCounter() const;
   void setLeakedHapticsSessionCounter(std::uint64_t count);
   // The reporter of the last snapshot, or null.
   [[nodiscard]] Reporter ailmentReporter() const;
   void setAilmentReporter(Reporter reporter);
-  // The report that was counted, or an empty dictionary.
+  // The report that was counted last, or an empty dictionary.
   [[nodiscard]] platform::Dictionary messageCache() const;
   void setMessageCache(platform::Dictionary message);
 
@@ -54,8 +56,8 @@ class HVReportingUtilityVEKStateManager {
   void takeSnapshot(AudioEventCategory category, const HVReportingSession& session,
                     std::string_view processName);
 
-  std::atomic<std::uint64_t> leakedHapticsSessionCounter_{0};  // orders with nothing
-  mutable std::mutex mutex_;  // held only to copy or exchange what follows
+  std::atomic<std::uint64_t> leakedHapticsSessionCounter_{0};  // relaxed: orders with nothing
+  mutable std::mutex mutex_;  // held only to copy or exchange the members below
   Reporter ailmentReporter_;
   platform::Dictionary messageCache_;
 };

@@ -71,7 +71,7 @@ TEST_F(HVReportingUtilityVEKStateManagerTest, ARepeatOfTheCountedReportIsIgnored
   handle(reportA());
   platform_.log.clear();
 
-  handle(Dictionary{{"Haptic_Active_Hardware_Time_Seconds", 30.0}});  // equal, though another one
+  handle(Dictionary{{"Haptic_Active_Hardware_Time_Seconds", 30.0}});  // equal, but another object
 
   EXPECT_EQ(manager_.leakedHapticsSessionCounter(), 1U);
   EXPECT_EQ(manager_.messageCache(), reportA());
@@ -122,7 +122,7 @@ TEST_F(HVReportingUtilityVEKStateManagerTest, EverySecondDistinctReportBringsASn
   EXPECT_EQ(snapshots(), 2U);
   EXPECT_EQ(platform_.diagnosticReporters.reportersMade(), 2U);
   EXPECT_NE(manager_.ailmentReporter(), first);
-  EXPECT_EQ(first.use_count(), 1);  // the manager let go of it
+  EXPECT_EQ(first.use_count(), 1);  // the manager released it
 }
 
 TEST_F(HVReportingUtilityVEKStateManagerTest, MessagesThatReportNoLeakDoNothing) {
@@ -181,7 +181,7 @@ TEST_F(HVReportingUtilityVEKStateManagerTest, TheSnapshotComesAtACountOfExactlyO
   EXPECT_EQ(snapshots(), 0U);
 }
 
-TEST_F(HVReportingUtilityVEKStateManagerTest, TheRememberedReportIsNotChangedBehindItsBack) {
+TEST_F(HVReportingUtilityVEKStateManagerTest, ChangingTheSentReportDoesNotChangeTheRememberedOne) {
   Message message = reportA();
   handle(message);
   message->set("more", 1);

@@ -9,10 +9,10 @@ namespace {
 
 constexpr std::string_view kUnit = "HVReportingUtility";
 
-// A time-out as a clock can add it: longer ones mean "for ever", a NaN or negative one "not at
-// all".
+// Returns a time-out that a clock can add without overflow. A longer one becomes 1e9 seconds, which
+// is about thirty years; NaN and negative ones become 0.
 std::chrono::nanoseconds boundedTimeout(double seconds) {
-  constexpr double kForEver = 1e9;  // some thirty years
+  constexpr double kForEver = 1e9;
   const double bounded = seconds > 0 ? std::min(seconds, kForEver) : 0;
   return std::chrono::duration_cast<std::chrono::nanoseconds>(
       std::chrono::duration<double>(bounded));
@@ -25,7 +25,7 @@ bool HVReportingUtilityWait(HVReportingUtilityCondition& condition, double timeo
                             std::string_view timeoutMessage, platform::LogCategory& logCategory) {
   using platform::LogLevel;
   using platform::UnitLog;
-  // The lines are logged under the lock, so that they stand in the order of what happened.
+  // Log under the lock, so that the lines are in the order of the events.
   std::unique_lock lock(condition.mutex);
   while (!*flag) {
     UnitLog::logTo(logCategory, kUnit, LogLevel::kInfo, "", waitingMessage);

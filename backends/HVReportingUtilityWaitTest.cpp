@@ -17,7 +17,7 @@ using namespace std::chrono_literals;
 using platform::FakeLogService;
 using platform::LogLevel;
 
-// Much longer than anything here takes: only a failing test waits for it.
+// Much longer than any step takes. Only a failing test waits for it.
 constexpr double kLongTimeout = 60;
 
 class HVReportingUtilityWaitTest : public testing::Test {
@@ -26,7 +26,7 @@ class HVReportingUtilityWaitTest : public testing::Test {
     return HVReportingUtilityWait(condition_, timeoutSeconds, &flag_, "waiting for it",
                                   "it did not come", HVReportingSessionCategory());
   }
-  // Returns once that many lines of that text were logged; false when that takes too long.
+  // Waits until the text was logged `count` times. Returns false if that takes too long.
   bool awaitLines(std::string_view text, std::ptrdiff_t count) {
     const auto deadline = std::chrono::steady_clock::now() + 30s;
     while (std::chrono::steady_clock::now() < deadline) {
@@ -36,7 +36,7 @@ class HVReportingUtilityWaitTest : public testing::Test {
     }
     return false;
   }
-  // A wake-up without a reason. The waiter holds the lock except while it waits.
+  // Causes a spurious wake-up. Takes the lock first: the waiter releases it only while it waits.
   void wakeForNothing() {
     const std::lock_guard lock(condition_.mutex);
     condition_.condition.notify_one();
@@ -126,7 +126,7 @@ TEST_F(HVReportingUtilityWaitTest, EachWakeUpGrantsTheWholeTimeoutAnew) {
   EXPECT_TRUE(result);
 }
 
-TEST_F(HVReportingUtilityWaitTest, ATimeoutThatIsNoneOrNegativeEndsAtOnce) {
+TEST_F(HVReportingUtilityWaitTest, ATimeoutThatIsNaNOrNegativeEndsAtOnce) {
   EXPECT_FALSE(wait(0));
   EXPECT_FALSE(wait(-5));
   EXPECT_FALSE(wait(std::numeric_limits<double>::quiet_NaN()));

@@ -9,13 +9,13 @@ class LogCategory;
 
 namespace halvox {
 
-// The identifier of a session that its client chose.
+// The identifier that a client chose for its session.
 enum class ReporterID : std::int64_t {};
-// The identifier that names no session.
+// Not the identifier of any session.
 inline constexpr ReporterID kNoReporterID{0};
 
-// What a message is about. The low 16 bits are the category proper, the high 16 bits may hold one
-// domain; the two are joined with `|`. Clients may send any value.
+// What a message is about. The low 16 bits are the category proper. The high 16 bits may have one
+// domain, combined by `|`. Clients may send any value, also one that is not listed.
 enum class AudioEventCategory : std::uint32_t {
   kUndefined = 0,
   kGeneric = 1,
@@ -47,7 +47,7 @@ constexpr AudioEventCategory operator|(AudioEventCategory left, AudioEventCatego
                                          static_cast<std::uint32_t>(right));
 }
 
-// What happened. Clients may send any value.
+// What happened. Clients may send any value, also one that is not listed.
 enum class AudioEventType : std::uint16_t {
   kStart = 1,
   kStop = 2,
@@ -70,7 +70,7 @@ enum class AudioEventType : std::uint16_t {
   kUnknown = 65535,
 };
 
-// What kind of audio a session is for. Clients may send any value.
+// The kind of audio of a session. Clients may send any value, also one that is not listed.
 enum class AudioServiceType : std::uint16_t {
   kGeneric = 0,
   kQuillo = 1,
@@ -89,11 +89,11 @@ enum class AudioServiceType : std::uint16_t {
   kUnknown = 65535,
 };
 
-// The subsystem that all components log under.
+// The subsystem under which all components log.
 inline constexpr std::string_view kHVReportingLogSubsystem = "com.tarno.halvox";
 
-// The log categories of the components, each made on first use and kept for the life of the
-// process. Any thread may ask.
+// The log categories of the components. Each is made on first use and lives as long as the process.
+// Any thread may call.
 platform::LogCategory& HVReportingClientCategory();
 platform::LogCategory& HVReportingServiceDelegateCategory();
 platform::LogCategory& HVReportingSessionCategory();

@@ -16,7 +16,7 @@ using platform::LogLevel;
 
 class HVReportingVocabularyTest : public testing::Test {
  protected:
-  // The subsystem and category of a line that is written to that category, joined with a slash.
+  // Logs a line to the category. Returns the subsystem and the category of that line, "a/b".
   std::string namesOf(LogCategory& category) {
     category.write(LogLevel::kError, "");
     const FakeLogService::Line line = platform_.log.lines().back();

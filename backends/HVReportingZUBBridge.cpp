@@ -34,8 +34,8 @@ std::string textUnder(const Dictionary& message, const Key& key) {
   return value == nullptr ? std::string() : describe(*value);
 }
 
-// The integer that a text begins with, behind blanks; 0 without one, the nearest end when it is too
-// large.
+// Returns the integer at the beginning of a text, after blanks; 0 without one. An integer out of
+// range becomes the smallest or the largest.
 std::int64_t leadingInteger(std::string_view text) {
   using Limits = std::numeric_limits<std::int64_t>;
   text.remove_prefix(std::min(text.find_first_not_of(" \t"), text.size()));
@@ -55,7 +55,7 @@ std::int32_t secondsUnder(const Dictionary& message, const Key& key) {
   return static_cast<std::int32_t>(seconds);
 }
 
-// The fields in the order in which missing ones are logged.
+// Reads the keys in this order because missing keys must be logged in this order.
 zubmetrics::AudioIssueDetected makeMetric(const Dictionary& message) {
   static const Key issueType("issue_type");
   static const Key rtaidClient("rtaid_client");

@@ -10,18 +10,19 @@ namespace halvox {
 
 class HVReportingSession;
 
-// Posts each issue that a client detected to the diagnostics metrics. Keeps no state; any thread.
-// What an issue does not tell is logged, and posted empty.
+// Posts each audio issue that a client detected to the diagnostics metrics. Keeps no state; any
+// thread may call. Returns no error: a missing key is logged, and its field stays empty.
 class HVReportingZUBBridge {
  public:
-  // Under which the issues are posted.
+  // The identifier of the metric.
   static constexpr std::uint32_t kAudioIssueDetectedMetricID = 0x5B0003;
 
   HVReportingZUBBridge() = delete;
 
-  // Posts one metric for a message of type kIssueDetector; does nothing for any other, or for none.
-  // Category and session do not matter. Texts are what describe() says of the values; the duration
-  // is a number's integer, or that which a text begins with, cut off to 32 bits.
+  // Posts one metric for a message of type kIssueDetector. Ignores messages of other types and a
+  // missing message. Does not use category and session. Text fields are describe() of the values.
+  // The duration is the low 32 bits of a number's integer, or of the integer at the beginning of a
+  // text. The metric has no timestamp.
   static void handleEvent(const platform::Message& message, AudioEventCategory category,
                           AudioEventType type, const std::shared_ptr<HVReportingSession>& session);
 };

@@ -25,7 +25,7 @@ class HVReportingZUBBridgeTest : public testing::Test {
   void handle(const Message& message, AudioEventType type = AudioEventType::kIssueDetector) {
     HVReportingZUBBridge::handleEvent(message, AudioEventCategory::kPlayback, type, nullptr);
   }
-  // The newest metric as it reads.
+  // Returns the newest metric as text.
   AudioIssueDetected posted() {
     const auto metrics = platform_.metrics.metrics();
     EXPECT_EQ(metrics.back().metricID, 5963779U);
@@ -128,8 +128,8 @@ TEST_F(HVReportingZUBBridgeTest, DurationsInTextsAreTheIntegerThatTheyBeginWith)
   EXPECT_EQ(durationOf(" \t-12 seconds"), -12);
   EXPECT_EQ(durationOf("+7.9"), 7);
   EXPECT_EQ(durationOf("4294967301"), 5);
-  EXPECT_EQ(durationOf("99999999999999999999"), -1);  // the low half of the largest integer
-  EXPECT_EQ(durationOf("-99999999999999999999"), 0);  // and of the smallest
+  EXPECT_EQ(durationOf("99999999999999999999"), -1);  // the low 32 bits of the largest integer
+  EXPECT_EQ(durationOf("-99999999999999999999"), 0);  // the low 32 bits of the smallest integer
   for (const char* text : {"", "  ", "-", "+", "+-7", "- 7", "x7"}) {
     EXPECT_EQ(durationOf(text), 0) << text;
   }

@@ -16,7 +16,7 @@ constexpr std::uint64_t kFinalMultiplier = 0x9ddfea08eb382d69U;
 
 constexpr std::size_t kBlock = 64;
 
-// All arithmetic is modulo 2^64, words are read in the order of this machine.
+// All arithmetic is modulo 2^64. Words are read in the byte order of this machine, as libc++ does.
 template <typename Word>
 Word wordAt(std::string_view text, std::size_t offset) {
   Word word;
@@ -26,7 +26,7 @@ Word wordAt(std::string_view text, std::size_t offset) {
 std::uint64_t word(std::string_view text, std::size_t offset) {
   return wordAt<std::uint64_t>(text, offset);
 }
-// The word that begins that many bytes before the end.
+// Returns the word that begins `distance` bytes before the end.
 std::uint64_t wordBeforeEnd(std::string_view text, std::size_t distance) {
   return word(text, text.size() - distance);
 }
@@ -47,8 +47,8 @@ std::uint64_t hashUpTo16(std::string_view text) {
   if (length >= 4) {
     const auto first = wordAt<std::uint32_t>(text, 0);
     const auto last = wordAt<std::uint32_t>(text, length - 4);
-    // Shifted in 32 bits, where the published algorithm keeps the bits that go out: this edition's
-    // own way, and kept.
+    // Shift in 32 bits and lose the upper bits. The published algorithm keeps them, but libc++ does
+    // not, and this must give libc++'s hashes.
     const std::uint32_t shifted = first << 3;
     return combine(length + shifted, last);
   }
@@ -75,8 +75,8 @@ struct Pair {
   std::uint64_t second;
 };
 
-// Mixes four words into two, starting from `start`: the sum of the words, and what remembers their
-// order.
+// Mixes four words into two, starting from `start`. The first result is the sum of the words; the
+// second depends on their order.
 Pair mixWords(Pair start, std::uint64_t w, std::uint64_t x, std::uint64_t y, std::uint64_t z,
               int rotation) {
   const std::uint64_t begin = start.first + w;
@@ -85,13 +85,13 @@ Pair mixWords(Pair start, std::uint64_t w, std::uint64_t x, std::uint64_t y, std
           std::rotr(start.second + begin + z, rotation) + std::rotr(middle, 44) + begin};
 }
 
-// The 32 bytes from an offset on.
+// Mixes the 32 bytes at an offset.
 Pair mix32(std::string_view text, std::size_t offset, Pair start) {
   return mixWords(start, word(text, offset), word(text, offset + 8), word(text, offset + 16),
                   word(text, offset + 24), 21);
 }
 
-// One half of a text of 33 to 64 bytes: the sums of four words, with rotations on the way.
+// Mixes one half of a text of 33 to 64 bytes: sums of four words, with rotations between them.
 Pair mixHalf(std::uint64_t a, std::uint64_t b, std::uint64_t c, std::uint64_t d) {
   const std::uint64_t two = a + b;
   const std::uint64_t three = two + c;
@@ -110,7 +110,7 @@ std::uint64_t hashUpTo64(std::string_view text) {
   return foldHigh(mixed * kPrime0 + front.second) * kPrime2;
 }
 
-// What is carried from block to block of a long text.
+// The state between the blocks of a long text.
 struct State {
   std::uint64_t x;
   std::uint64_t y;
@@ -118,7 +118,7 @@ struct State {
   Pair v;
   Pair w;
 
-  // Begins with the last 64 bytes.
+  // Starts from the last 64 bytes.
   explicit State(std::string_view text)
       : x(wordBeforeEnd(text, 40)),
         y(wordBeforeEnd(text, 16) + wordBeforeEnd(text, 56)),
@@ -128,7 +128,8 @@ struct State {
     x = x * kPrime1 + word(text, 0);
   }
 
-  // Takes the block at an offset. The order of the lines matters.
+  // Mixes the block at an offset into the state. Each line uses results of the lines before it:
+  // keep their order.
   void take(std::string_view text, std::size_t offset) {
     x = std::rotr(x + y + v.first + word(text, offset + 8), 37) * kPrime1;
     y = std::rotr(y + v.second + word(text, offset + 48), 42) * kPrime1;
@@ -150,7 +151,7 @@ struct State {
 
 std::uint64_t hashLong(std::string_view text) {
   State state(text);
-  // All whole blocks but the last bytes, which came first.
+  // The constructor has used the last bytes, so the last block is skipped here.
   for (std::size_t offset = 0; offset + kBlock < text.size(); offset += kBlock) {
     state.take(text, offset);
   }

@@ -10,7 +10,7 @@
 namespace halvox {
 namespace {
 
-TEST(StringHashTest, HashesAreThoseThatTheOtherStandardLibraryMade) {
+TEST(StringHashTest, HashesEqualThoseOfLibcxx) {
   std::ifstream file(std::filesystem::path(__FILE__).parent_path() / "testdata/string_hashes.txt");
   ASSERT_TRUE(file.is_open());
   file >> std::hex;

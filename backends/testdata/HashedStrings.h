@@ -6,8 +6,8 @@
 
 namespace halvox {
 
-// The texts whose hashes are in string_hashes.txt, line by line: of any bytes and of the lengths 0
-// to 300 in turn. The same on every machine.
+// Makes the texts whose hashes are in string_hashes.txt, one a line: arbitrary bytes, with lengths
+// from 0 to 300 in turn. The same on every machine.
 inline constexpr std::size_t kHashedStrings = 10'000;
 
 inline std::string hashedString(std::size_t index) {

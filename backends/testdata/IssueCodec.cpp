@@ -1,9 +1,9 @@
-// Lets other programs use the issue metric's reader and writer. Prints one message a line:
-// timestamp ("-" for none), duration, and the three texts in hexadecimal digits.
+// Makes the reader and the writer of the issue metric available to other programs. Prints one
+// message a line: timestamp ("-" for none), duration, and the three texts in hexadecimal digits.
 //
-//   write COUNT   prints that many random messages, each with its encoded bytes in front
-//   read          reads encoded bytes, a message a line in hexadecimal digits; prints "error" in
-//                 front of what could be read of a broken one, "ok" in front of any other
+//   write COUNT   prints COUNT random messages, each after its encoded bytes
+//   read          reads encoded messages, one a line in hexadecimal digits; prints each after "ok",
+//                 or after "error" with the fields before the error
 
 #include <charconv>
 #include <cstdint>

@@ -9,8 +9,8 @@
 
 namespace halvox::zubmetrics {
 
-// Makes messages of any content, edges of the numbers more often than chance would. The same ones
-// for the same seed.
+// Makes random messages, with the largest numbers more often than by chance. The same seed gives
+// the same messages.
 class RandomIssues {
  public:
   RandomIssues(std::uint64_t seed, std::size_t longestText)
@@ -27,7 +27,7 @@ class RandomIssues {
   }
 
  private:
-  // Of any length in bits.
+  // Returns a number of any length in bits.
   std::uint64_t number() {
     const std::uint64_t all = random_() % 8 == 0 ? ~std::uint64_t{0} : random_();
     return all >> (random_() % 64);

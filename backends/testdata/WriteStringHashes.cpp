@@ -1,4 +1,4 @@
-// Writes string_hashes.txt, with the standard library whose hash StringHash has:
+// Writes string_hashes.txt by means of libc++, whose hash StringHash implements:
 //
 //   clang++ -std=c++20 -stdlib=libc++ -I. backends/testdata/WriteStringHashes.cpp -o /tmp/write
 //   /tmp/write >backends/testdata/string_hashes.txt
@@ -8,7 +8,7 @@
 
 #include "backends/testdata/HashedStrings.h"
 
-// Does not compile with any other standard library: those have another hash.
+// Compiles only with libc++: other standard libraries have another hash.
 static_assert(_LIBCPP_VERSION > 0);
 
 int main() {

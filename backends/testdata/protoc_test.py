@@ -1,7 +1,7 @@
 #!/usr/bin/python3
-"""Lets protoc read the issue metrics that we write, and us read those that protoc writes.
+"""Checks that protoc reads the issue metrics that this project writes, and the reverse.
 
-The argument is the program of IssueCodec.cpp. Exit status 77 means that protoc is missing.
+The argument is the program built from IssueCodec.cpp. Exit status 77 means that protoc is missing.
 """
 
 import shutil
@@ -23,7 +23,7 @@ narrow: 8
 
 
 def protoc(mode, data, check=True):
-    """What protoc makes of the data; None when it refuses it."""
+    """Returns what protoc prints for the data; None when it refuses them."""
     arguments = [] if mode == "--decode_raw" else [f"-I{HERE}", "audio_issue.proto"]
     done = subprocess.run(["protoc", mode, *arguments], input=data, capture_output=True)
     if check and done.returncode != 0:
@@ -32,7 +32,7 @@ def protoc(mode, data, check=True):
 
 
 def written(count):
-    """Messages that we wrote: their bytes, and the fields that they were made of."""
+    """Yields messages that IssueCodec wrote: the bytes, and the fields they were made from."""
     output = subprocess.run([CODEC, "write", str(count)], capture_output=True, check=True, text=True)
     for line in output.stdout.splitlines():
         encoded, *fields = line.split("\t")
@@ -40,7 +40,7 @@ def written(count):
 
 
 def read(messages):
-    """What we read of each message: "ok" or "error", then its fields."""
+    """Returns what IssueCodec reads from each message: "ok" or "error", then its fields."""
     lines = "".join(message.hex() + "\n" for message in messages)
     output = subprocess.run([CODEC, "read"], input=lines, capture_output=True, check=True, text=True)
     return [line.split("\t") for line in output.stdout.splitlines()]
@@ -55,12 +55,12 @@ def varint(number):
 
 
 def escaped(digits):
-    """The bytes as protoc's text form takes them."""
+    """Returns the bytes in the escaped form of protoc's text format."""
     return "".join(f"\\{byte:03o}" for byte in bytes.fromhex(digits))
 
 
 def text_of(fields):
-    """The fields of a message in protoc's text form."""
+    """Returns the fields of a message in protoc's text format."""
     timestamp, duration, *texts = fields
     lines = [] if timestamp == "-" else [f"timestamp: {timestamp}"]
     lines.append(f"duration: {duration}")
@@ -77,12 +77,12 @@ class ProtocTest(unittest.TestCase):
         text = "".join(text_of(fields) for _, fields in messages)
 
         self.assertEqual(protoc("--encode=halvox.test.Issues", text.encode()), ours)
-        # and what it decodes from ours is what it would from its own
+        # Decoding our bytes and encoding the result gives the same bytes.
         self.assertEqual(
             protoc("--encode=halvox.test.Issues", protoc("--decode=halvox.test.Issues", ours)), ours)
 
     def test_protoc_reads_what_we_write_field_by_field(self):
-        # Texts that cannot be messages themselves, as which protoc would show them.
+        # Use texts that are not valid messages: protoc would show those as messages.
         for encoded, shown in (
                 ("10001a0022002a00", '2: 0\n3: ""\n4: ""\n5: ""\n'),
                 ("08ac02100c1a06676c6974636822016f2a0167",
