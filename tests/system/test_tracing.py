@@ -1,7 +1,6 @@
 """Traces of a real service by a real LTTng, in scratch directories of their own.
 
-LTTng's directories are per user, and root's are the machine's own, so all of this module runs
-unprivileged: it gives up being root for good.
+This module gives up being root for good; see isolation.py.
 """
 
 import json
@@ -13,8 +12,9 @@ import subprocess
 import unittest
 from pathlib import Path
 
-from harness import BIN, CTL, DEADLINE, WITH_US, require, stop_process, wait_for
-from tracing import (CLIENT, REPORTER, THREADS, TracedService, children_of, is_running,
+from harness import DEADLINE, WITH_US, require, stop_process, wait_for
+from isolation import program
+from tracing import (REPORTER, THREADS, TracedService, children_of, is_running,
                      require_tracer, start_session, traced_session, waits_for_processor,
                      wait_for_results)
 
@@ -98,7 +98,7 @@ class KernelTraceTest(unittest.TestCase):
             with traced_session(service):
                 daemon = service.daemon()
                 client = subprocess.Popen(
-                    [*WITH_US, "taskset", "-c", str(processor), str(CLIENT), "burst", str(events)],
+                    [*WITH_US, "taskset", "-c", str(processor), str(program("halvox_trace_client")), "burst", str(events)],
                     env=service.client_environment(), text=True,
                     stdin=subprocess.PIPE, stdout=subprocess.PIPE)
                 try:
@@ -262,7 +262,7 @@ class ToolTest(unittest.TestCase):
     def run_tool(self, service, *arguments):
         environment = {**service._environment, "HALVOX_SOCKET": str(service.socket),
                        "LTTNG_UST_REGISTER_TIMEOUT": "10000"}
-        return subprocess.run([str(CTL), "trace", *map(str, arguments)], env=environment,
+        return subprocess.run([str(program("halvoxctl")), "trace", *map(str, arguments)], env=environment,
                               capture_output=True, text=True, timeout=120, check=False)
 
     def record(self, service, *command):
@@ -270,7 +270,7 @@ class ToolTest(unittest.TestCase):
 
     def test_program_is_traced_shown_and_exported(self):
         with TracedService() as service:
-            done = self.record(service, CLIENT, "intervals", 5)
+            done = self.record(service, program("halvox_trace_client"), "intervals", 5)
             self.assertEqual(done.returncode, 0, done.stderr)
             # The program's own line comes first.
             measured, *lines = map(json.loads, done.stdout.splitlines())

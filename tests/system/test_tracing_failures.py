@@ -6,12 +6,12 @@ No LTTng is needed, and none is met: the service finds the programs of the test 
 import unittest
 
 from harness import DEADLINE, wait_for
-from tracing import (REPORTER, TracedService, give_up_root, start_session,
+from tracing import (REPORTER, TracedService, isolate, start_session,
                      traced_session, wait_for_results)
 
 
 def setUpModule():
-    give_up_root()
+    isolate()
 
 
 class NoTracerTest(unittest.TestCase):

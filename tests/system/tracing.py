@@ -11,27 +11,26 @@ import subprocess
 import unittest
 from pathlib import Path
 
-from harness import BIN, DEADLINE, Service, WITH_US, require, wait_for
+import isolation
+from harness import DEADLINE, Service, WITH_US, require, wait_for
+from isolation import program
 
-CLIENT = BIN / "halvox_trace_client"
-NOBODY = 65534
+PROGRAMS = ("halvox-reportingd", "halvoxctl", "halvox_trace_client", "halvox-tracer-keeper",
+            "halvox-kdebug-lttng.so")
 TEST = 11
 REPORTER = 7
 THREADS = 4
 
 
-def give_up_root():
-    """For good: LTTng's directories are per user, and root's are the machine's own."""
-    if os.getuid() == 0:
-        os.setgroups([])
-        os.setgid(NOBODY)
-        os.setuid(NOBODY)
+def isolate():
+    """For the whole module: it is not root, and its tracer is its own."""
+    isolation.enter(*PROGRAMS)
 
 
 def require_tracer():
-    """Gives up being root, and skips the module when the build or the machine cannot record."""
+    """The same, and skips the module when the build or the machine cannot record."""
     require("lttng-sessiond", "lttng", "babeltrace2")
-    give_up_root()
+    isolate()
     with TracedService() as service:
         if not service.has_tracer():
             raise unittest.SkipTest("LTTng is not in this build")
@@ -56,7 +55,8 @@ class TracedService(Service):
     """A service with a tracer's home of its own, in which nothing runs at first."""
 
     def __init__(self, switch="true"):
-        super().__init__(f'[features.Acoustat]\nTracing = {switch}\n[log]\nlevel = "debug"\n')
+        super().__init__(f'[features.Acoustat]\nTracing = {switch}\n[log]\nlevel = "debug"\n',
+                         command=[str(program("halvox-reportingd"))])
         self.home = self.directory / "home"
         self.home.mkdir()
         self.environment = {"HOME": str(self.home), "LTTNG_HOME": str(self.home),
@@ -120,13 +120,13 @@ class TracedService(Service):
         return {**os.environ, **self.environment, "LTTNG_UST_REGISTER_TIMEOUT": "10000"}
 
     def run_client(self, *arguments):
-        done = subprocess.run([*WITH_US, str(CLIENT), *map(str, arguments)],
+        done = subprocess.run([*WITH_US, str(program("halvox_trace_client")), *map(str, arguments)],
                               env=self.client_environment(),
                               capture_output=True, text=True, timeout=120, check=True)
         return json.loads(done.stdout)
 
     def lttng(self, *arguments):
-        return subprocess.run(["lttng", "--no-sessiond", "-n", *map(str, arguments)],
+        return subprocess.run([*WITH_US, "lttng", "--no-sessiond", "-n", *map(str, arguments)],
                               env={**os.environ, **self.environment}, capture_output=True,
                               text=True, timeout=DEADLINE, check=False)
 

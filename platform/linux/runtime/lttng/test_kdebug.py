@@ -1,7 +1,7 @@
 """The tracepoint provider with a real session daemon, in a scratch directory of its own.
 
-The daemon, the probe and the tools run as an unprivileged user, so that they meet nobody else's
-daemon and root's runs are the same as everybody's. All that is started is stopped by process id.
+This module gives up being root for good; see isolation.py. All that is started is stopped by process
+id.
 """
 
 import os
@@ -13,11 +13,17 @@ import time
 import unittest
 from pathlib import Path
 
-PROBE = Path(os.environ["HALVOX_BIN"]) / "halvox_kdebug_probe"
-TOOLS = ["lttng-sessiond", "lttng", "babeltrace2"] + (["setpriv"] if os.getuid() == 0 else [])
+import isolation
+
+TOOLS = ["lttng-sessiond", "lttng", "babeltrace2", "setpriv"]
 MISSING = [tool for tool in TOOLS if shutil.which(tool) is None]
 DEADLINE = 30.0
-NOBODY = 65534
+# Whatever ends a test also ends what it started.
+WITH_US = ["setpriv", "--pdeathsig", "KILL", "--"]
+
+
+def setUpModule():
+    isolation.enter("halvox_kdebug_probe", "halvox-kdebug-lttng.so")
 
 
 def wait_for(what, condition):
@@ -33,15 +39,11 @@ class KdebugTest(unittest.TestCase):
     def setUp(self):
         self.home = Path(tempfile.mkdtemp(prefix="halvox-lttng-"))
         self.addCleanup(shutil.rmtree, self.home, ignore_errors=True)
-        self.prefix = []
-        if os.getuid() == 0:
-            os.chown(self.home, NOBODY, NOBODY)
-            self.prefix = ["setpriv", f"--reuid={NOBODY}", f"--regid={NOBODY}", "--clear-groups"]
         self.environment = dict(os.environ, HOME=str(self.home), LTTNG_HOME=str(self.home))
 
     def start(self, *command, **options):
         process = subprocess.Popen(
-            self.prefix + [str(part) for part in command],
+            WITH_US + [str(part) for part in command],
             env=dict(self.environment, **options.pop("environment", {})), text=True, **options)
 
         def stop():
@@ -55,7 +57,7 @@ class KdebugTest(unittest.TestCase):
         return process
 
     def run_tool(self, *command):
-        return subprocess.run(self.prefix + [str(part) for part in command], env=self.environment,
+        return subprocess.run(WITH_US + [str(part) for part in command], env=self.environment,
                               capture_output=True, text=True, timeout=DEADLINE, check=False)
 
     def start_daemon(self):
@@ -84,8 +86,8 @@ class KdebugTest(unittest.TestCase):
         return [line[line.index("halvox:"):] for line in result.stdout.splitlines()]
 
     def start_probe(self, **environment):
-        probe = self.start(PROBE, environment=environment, bufsize=1,
-                           stdin=subprocess.PIPE, stdout=subprocess.PIPE)
+        probe = self.start(isolation.program("halvox_kdebug_probe"), environment=environment,
+                           bufsize=1, stdin=subprocess.PIPE, stdout=subprocess.PIPE)
         self.assertEqual(probe.stdout.readline(), "ready\n")
         return probe
 
@@ -98,7 +100,7 @@ class KdebugTest(unittest.TestCase):
         self.start_daemon()
         self.start_session()
         # Waits for the daemon, so that no event is emitted before it listens.
-        probe = self.start_probe(LTTNG_UST_REGISTER_TIMEOUT="-1")
+        probe = self.start_probe(LTTNG_UST_REGISTER_TIMEOUT="10000")
 
         self.emit(probe, 3)
 

@@ -29,12 +29,12 @@ class SessionDaemon {
 
   // Takes over the daemon that the file names, if it still runs; otherwise the file goes. Waits for
   // the keeper of an earlier service that is still at work. Our sessions have names that start with
-  // `ownSessions`.
-  void adopt(const std::string& ownSessions = {});
+  // `ownSessions`, which is not empty.
+  void adopt(const std::string& ownSessions);
   [[nodiscard]] bool isNoted() const;
   // Ends the daemon that was ours and does not answer any more, starts another and waits until it
   // answers; or ends it and tells why not.
-  [[nodiscard]] std::optional<std::string> start(const std::string& ownSessions = {});
+  [[nodiscard]] std::optional<std::string> start(const std::string& ownSessions);
   [[nodiscard]] bool isOurs() const { return process_.has_value(); }
   // Ends the daemon, if it is ours, and waits until it is gone.
   void end();

@@ -115,7 +115,7 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
 
 int main(int count, char** arguments) {
   const std::vector<std::string> words(arguments, arguments + count);
-  if (words.size() != 3 && words.size() != 5) return EXIT_FAILURE;
+  if ((words.size() != 3 && words.size() != 5) || words[2].empty()) return EXIT_FAILURE;
   // Nobody waits for the daemon when it ends, so it must leave without that.
   std::signal(SIGCHLD, SIG_IGN);
   std::signal(SIGPIPE, SIG_IGN);

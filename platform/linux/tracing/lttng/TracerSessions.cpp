@@ -18,6 +18,7 @@ std::vector<std::string> tracerSessionNames() {
 }
 
 void destroyTracerSessions(std::string_view prefix) {
+  if (prefix.empty()) return;
   for (const std::string& name : tracerSessionNames()) {
     if (name.starts_with(prefix)) static_cast<void>(::lttng_destroy_session_no_wait(name.c_str()));
   }

@@ -10,7 +10,8 @@ namespace halvox::platform::linux_ {
 // the daemon, without end if it hangs. The control library is not for several threads at once.
 [[nodiscard]] std::vector<std::string> tracerSessionNames();
 
-// Destroys the sessions whose names start so, without waiting for what they recorded.
+// Destroys the sessions whose names start so, without waiting for what they recorded. An empty
+// prefix names none: those of others are never touched.
 void destroyTracerSessions(std::string_view prefix);
 
 }  // namespace halvox::platform::linux_
