@@ -18,6 +18,9 @@ import unittest
 from pathlib import Path
 
 BIN = Path(os.environ.get("HALVOX_BIN", Path(__file__).parents[2] / "build/dev/bin")).resolve()
+# What these tests run of the build, and what that needs beside itself.
+PROGRAMS = ("halvox-reportingd", "halvoxctl", "halvox-tracer-keeper", "halvox-kdebug-lttng.so",
+            "halvox_kdebug_probe", "halvox_trace_client")
 NOBODY = 65534
 ROOTS_DAEMON = Path("/run/lttng/client-lttng-sessiond")
 
@@ -27,6 +30,7 @@ _MS_REC = 0x4000
 _MS_PRIVATE = 1 << 18
 
 _directory = BIN  # of the programs that are run
+_is_entered = False
 
 
 def program(name):
@@ -34,14 +38,17 @@ def program(name):
     return _directory / name
 
 
-def enter(*programs):
-    """Gives up being root and hides root's tracer, both for good; the module uses these programs.
+def enter():
+    """Gives up being root and hides root's tracer, both for good.
 
     Skips the module if its traces could end up in the daemon of somebody else.
     """
+    global _is_entered
+    if _is_entered:
+        return
     is_root = os.getuid() == 0
     if is_root:
-        _share(programs)
+        _share_programs()
     is_hidden = _hide_tracer()
     if is_root:
         try:
@@ -53,13 +60,14 @@ def enter(*programs):
     elif not is_hidden and _may_use_roots_daemon() and ROOTS_DAEMON.exists():
         raise unittest.SkipTest("this user is in the group tracing, a tracer of root runs, and it "
                                 "cannot be hidden from the tests")
+    _is_entered = True
 
 
 def _is_open_to_others(directory):
     return all(path.stat().st_mode & stat.S_IXOTH for path in (directory, *directory.parents))
 
 
-def _share(programs):
+def _share_programs():
     """Has temporary files where others may read them, and copies of the programs if need be."""
     global _directory
     candidates = [Path(tempfile.gettempdir()), Path("/tmp"), Path("/var/tmp")]
@@ -75,7 +83,7 @@ def _share(programs):
     # A build below somebody's home, such as root's own.
     _directory = scratch / "bin"
     _directory.mkdir()
-    for name in programs:
+    for name in PROGRAMS:
         if (BIN / name).exists():
             shutil.copy(BIN / name, _directory)
             _copy_libraries(BIN / name)

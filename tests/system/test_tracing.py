@@ -5,6 +5,7 @@ This module gives up being root for good; see isolation.py.
 
 import json
 import os
+import plistlib
 import re
 import signal
 import statistics
@@ -14,8 +15,8 @@ from pathlib import Path
 
 from harness import DEADLINE, WITH_US, require, stop_process, wait_for
 from isolation import program
-from tracing import (REPORTER, THREADS, TracedService, children_of, is_running,
-                     require_tracer, start_session, traced_session, waits_for_processor,
+from tracing import (POINTS, REPORTER, THREADS, TracedService, children_of, interval,
+                     is_running, require_tracer, start_session, traced_session, waits_for_processor,
                      wait_for_results)
 
 PAIRS = 50
@@ -294,6 +295,69 @@ class ToolTest(unittest.TestCase):
 
             self.assertEqual(done.returncode, 1)
             self.assertIn("false ended with status 1", done.stderr)
+
+    def assert_refused(self, service, *reasons):
+        """Of the parameters file, before the program runs."""
+        mark = service.directory / "ran"
+        done = self.record(service, "touch", mark)
+        self.assertNotEqual(done.returncode, 0)
+        self.assertEqual(done.stdout, "")
+        for reason in (str(service.params), *reasons):
+            self.assertIn(reason, done.stderr)
+        self.assertFalse(mark.exists())
+
+    def test_parameters_file_that_is_no_property_list_is_told(self):
+        with TracedService() as service:
+            for text in ("", "hello", "<plist><dict><key>Children</key>"):
+                with self.subTest(text):
+                    service.params.write_text(text)
+                    self.assert_refused(service, "Reading from plist file failed with error: ",
+                                        "the property list ")
+
+    def test_parameters_file_that_cannot_be_read_is_told(self):
+        with TracedService() as service:
+            service.params.unlink()
+            self.assert_refused(service, "No such file or directory")
+            service.params.mkdir()
+            self.assert_refused(service, "Is a directory")
+
+    def test_parameters_file_without_an_interval_is_told_with_what_is_wrong_in_it(self):
+        with TracedService() as service:
+            service.params.write_bytes(plistlib.dumps({"Kinder": []}))
+            self.assert_refused(service, "Failed to load Trace Parameter Array with error: "
+                                         "expected an array, found (null)")
+            service.write_params("none")
+            self.assert_refused(service, "Failed to read the Trace Points from the plist file "
+                                         "with error: expected an array, found a string")
+            service.write_params([{**POINTS[0], "Type": "Intervall"}])
+            self.assert_refused(service, "TracePointType field not recognized or is empty.")
+            service.write_params([{**POINTS[0], "Type": "Impulse"}])
+            self.assert_refused(service, "no interval")
+            service.write_params(POINTS, trace_type="OSSignpost")
+            self.assert_refused(service, "OSSignpost")
+
+    def test_parameters_file_whose_codes_are_never_recorded_is_told(self):
+        with TracedService() as service:
+            service.write_params([interval("IOStart", 0x1A2B0001, 0x1A2B0002)])
+
+            self.assert_refused(service, "IOStart", "0x1a2b0001", "0x21040000")
+
+    def test_parameters_file_that_is_partly_wrong_is_told_beside_the_results(self):
+        with TracedService() as service:
+            service.write_params([POINTS[0], {**POINTS[1], "Type": "Intervall"}])
+            done = self.record(service, program("halvox_trace_client"), "intervals", 1)
+
+            self.assertEqual(done.returncode, 0, done.stderr)
+            self.assertIn('"Shared"', done.stdout)
+            self.assertIn("TracePointType field not recognized or is empty.", done.stderr)
+
+    def test_program_that_emits_nothing_is_told(self):
+        with TracedService() as service:
+            done = self.record(service, "true")
+
+            self.assertNotEqual(done.returncode, 0)
+            self.assertEqual(done.stdout, "")
+            self.assertIn("nothing was measured", done.stderr)
 
     def test_service_that_does_not_trace_is_told(self):
         with TracedService(switch="false") as service:

@@ -5,13 +5,14 @@ No LTTng is needed, and none is met: the service finds the programs of the test 
 
 import unittest
 
+import isolation
 from harness import DEADLINE, wait_for
-from tracing import (REPORTER, TracedService, isolate, start_session,
-                     traced_session, wait_for_results)
+from tracing import (REPORTER, TracedService, start_session, traced_session,
+                     wait_for_results)
 
 
 def setUpModule():
-    isolate()
+    isolation.enter()
 
 
 class NoTracerTest(unittest.TestCase):

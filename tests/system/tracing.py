@@ -15,22 +15,15 @@ import isolation
 from harness import DEADLINE, Service, WITH_US, require, wait_for
 from isolation import program
 
-PROGRAMS = ("halvox-reportingd", "halvoxctl", "halvox_trace_client", "halvox-tracer-keeper",
-            "halvox-kdebug-lttng.so")
 TEST = 11
 REPORTER = 7
 THREADS = 4
 
 
-def isolate():
-    """For the whole module: it is not root, and its tracer is its own."""
-    isolation.enter(*PROGRAMS)
-
-
 def require_tracer():
-    """The same, and skips the module when the build or the machine cannot record."""
+    """Isolates the module, and skips it when the build or the machine cannot record."""
     require("lttng-sessiond", "lttng", "babeltrace2")
-    isolate()
+    isolation.enter()
     with TracedService() as service:
         if not service.has_tracer():
             raise unittest.SkipTest("LTTng is not in this build")

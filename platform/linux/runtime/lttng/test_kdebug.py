@@ -23,7 +23,7 @@ WITH_US = ["setpriv", "--pdeathsig", "KILL", "--"]
 
 
 def setUpModule():
-    isolation.enter("halvox_kdebug_probe", "halvox-kdebug-lttng.so")
+    isolation.enter()
 
 
 def wait_for(what, condition):
