@@ -19,9 +19,11 @@
 
 #include "client/HalvoxClient.h"
 #include "client/Vocabulary.h"
+#include "platform/linux/tracing/PlistPropertyListService.h"
 #include "tools/JsonText.h"
 #include "tools/ServiceConfiguration.h"
 #include "tools/TraceResults.h"
+#include "tracing/TraceParamsParser.h"
 
 namespace halvox::tools {
 namespace {
@@ -31,6 +33,9 @@ namespace fs = std::filesystem;
 constexpr const char* kResultsFile =
     "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Traces/tracing_results.ssj";
 constexpr client::ServiceType kTestService = 11;
+// The codes that the service records.
+constexpr std::uint32_t kFirstCode = 0x21040000;
+constexpr std::uint32_t kLastCode = 0x2104408A;
 // The stop is answered when the trace has been read back.
 constexpr std::chrono::minutes kStopWithin{10};
 
@@ -81,6 +86,55 @@ void printJson(const TraceResults& results, std::ostream& out) {
   }
 }
 
+// What a trace parameters file comes to.
+struct ParamsFindings {
+  std::size_t intervals = 0;           // that can be measured
+  std::vector<std::string> reasons{};  // why others are not: what the service logs, and more
+};
+
+class ParamsListener final : public TraceParamsParser::Listener {
+ public:
+  explicit ParamsListener(std::vector<std::string>& reasons) : reasons_(reasons) {}
+  void onError(const std::string& sentence) override { reasons_.push_back(sentence); }
+  void onTracePoint(const TraceDataParams& /*point*/) override {}
+
+ private:
+  std::vector<std::string>& reasons_;
+};
+
+bool isRecorded(std::uint32_t code) { return code >= kFirstCode && code <= kLastCode; }
+
+std::string hexadecimal(std::uint32_t code) {
+  std::array<char, 16> text{};
+  std::snprintf(text.data(), text.size(), "0x%08x", code);
+  return text.data();
+}
+
+// Reads the file as the service is going to.
+ParamsFindings checkParams(const std::string& file) {
+  ParamsFindings found;
+  ParamsListener listener(found.reasons);
+  const platform::linux_::PlistPropertyListService lists;
+  const TraceParams params = TraceParamsParser(file).loadTraceParams(lists, listener);
+  if (params.type == TraceType::kSignpost) {
+    found.reasons.emplace_back("its TraceType is OSSignpost, of which nothing is recorded");
+    return found;
+  }
+  for (const TraceDataParams& point : params.tracePoints) {
+    if (point.kind != TracePointKind::kInterval) continue;
+    if (isRecorded(point.beginCode) && isRecorded(point.endCode)) {
+      ++found.intervals;
+    } else {
+      found.reasons.push_back("the interval " + point.name + " goes from " +
+                              hexadecimal(point.beginCode) + " to " + hexadecimal(point.endCode) +
+                              ", but only codes from " + hexadecimal(kFirstCode) + " to " +
+                              hexadecimal(kLastCode) + " are recorded");
+    }
+  }
+  if (found.intervals == 0) found.reasons.emplace_back("it has no interval that can be measured");
+  return found;
+}
+
 // Which file it is and when it was written; a new file is another one.
 std::pair<ino_t, std::int64_t> identityOf(const fs::path& file) {
   struct stat status {};
@@ -122,6 +176,29 @@ class TracedSession {
   const std::unique_ptr<client::HalvoxConnection> connection_;
 };
 
+void print(const TraceResults& results, OutputForm form, std::ostream& out) {
+  form == OutputForm::kJson ? printJson(results, out) : printTable(results, out);
+}
+
+// Prints what was measured with these parameters, or complains that nothing was.
+ExitStatus showMeasured(const std::string& file, const std::string& params, OutputForm form,
+                        std::ostream& out, const Complaint& complain) {
+  const auto read = readTraceResults(file);
+  if (const auto* error = std::get_if<std::string>(&read)) {
+    return complain(ExitStatus::kBadArguments, file + ": " + *error);
+  }
+  const auto& results = std::get<TraceResults>(read);
+  const auto isEmpty = [](const auto& entry) { return entry.second.empty(); };
+  if (std::ranges::all_of(results.values, isEmpty)) {
+    return complain(ExitStatus::kRefused,
+                    "nothing was measured: either no program emitted both codes of an interval, or "
+                    "the service could not record or could not read " +
+                        params + "; the service's log says which");
+  }
+  print(results, form, out);
+  return ExitStatus::kDone;
+}
+
 // What is wrong with how the program ran; empty when nothing is.
 std::string runProgram(std::vector<std::string> command) {
   std::vector<char*> arguments;
@@ -150,9 +227,11 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
   const fs::path results =
       std::get<platform::linux_::Configuration>(configuration).storage.root / kResultsFile;
   const std::string params = fs::absolute(request.params).string();
-  if (::access(params.c_str(), R_OK) != 0) {
-    return complain(ExitStatus::kBadArguments, params + ": " + std::strerror(errno));
+  const ParamsFindings found = checkParams(params);
+  for (const std::string& reason : found.reasons) {
+    complain(ExitStatus::kBadArguments, params + ": " + reason);
   }
+  if (found.intervals == 0) return ExitStatus::kBadArguments;
   const auto before = identityOf(results);
   const auto socket = namedSocket(options, complain);
   if (const auto* status = std::get_if<ExitStatus>(&socket)) return *status;
@@ -174,7 +253,7 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
                     "the service left no new results in " + results.string() +
                         "; it traces when Tracing is on in [features.Acoustat]");
   }
-  const ExitStatus shown = showTrace({results.string()}, options.form(), out, errors);
+  const ExitStatus shown = showMeasured(results.string(), params, options.form(), out, complain);
   return ofProgram.empty() ? shown : ExitStatus::kRefused;
 }
 
@@ -185,8 +264,7 @@ ExitStatus showTrace(const ShowTrace& request, OutputForm form, std::ostream& ou
   if (const auto* error = std::get_if<std::string>(&read)) {
     return complain(ExitStatus::kBadArguments, request.file + ": " + *error);
   }
-  const auto& results = std::get<TraceResults>(read);
-  form == OutputForm::kJson ? printJson(results, out) : printTable(results, out);
+  print(std::get<TraceResults>(read), form, out);
   return ExitStatus::kDone;
 }
 

@@ -21,8 +21,9 @@ struct ExportTrace {
 };
 
 // Has the service trace while a program runs, and prints what was measured. The service must be one
-// whose configuration this is and trace at all. Fails when the program does, when the service
-// refuses and when it leaves no new results.
+// whose configuration this is and trace at all. Says what is wrong in the trace parameters file,
+// and does not run the program when nothing in the file can be measured. Fails when the program
+// does, when the service refuses, when it leaves no new results, and when nothing was measured.
 ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options, std::ostream& out,
                        std::ostream& errors);
 

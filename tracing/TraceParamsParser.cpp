@@ -2,8 +2,8 @@
 
 #include <charconv>
 #include <optional>
+#include <utility>
 
-#include "platform/property_list.h"
 #include "platform/services.h"
 #include "tracing/TraceLog.h"
 
@@ -59,19 +59,6 @@ std::string kindError(const Value* value, std::string_view expected) {
   return text;
 }
 
-Array children(const Dictionary& parent, std::string_view key, const char* failure) {
-  const Value* value = parent.find(key);
-  if (value != nullptr && value->isArray()) return value->array();
-  kLog.error(failure, kindError(value, "an array"));
-  return {};
-}
-
-Dictionary element(const Value& value, const char* failure) {
-  if (value.isDictionary()) return value.dictionary();
-  kLog.error(failure, kindError(&value, "a dictionary"));
-  return {};
-}
-
 // Reads as many hexadecimal digits as there are from the start, after a "0x" if there is one.
 // Without a digit 0, and of too large a number the largest.
 std::uint32_t scanHexadecimal(std::string_view text) {
@@ -82,27 +69,67 @@ std::uint32_t scanHexadecimal(std::string_view text) {
   return result.ec == std::errc::result_out_of_range ? UINT32_MAX : code;
 }
 
-// The dictionary that the file holds.
-Dictionary readRoot(const std::string& path) {
-  std::optional<Error> error;
-  const auto& lists = platform::propertyLists();
-  const auto bytes = lists.readFile(path, error);
-  if (!bytes.has_value()) kLog.error(kReadingFailed, shown(error));
-  error.reset();
-  const auto root = lists.parse(bytes, error);
-  if (!root.has_value()) {
-    kLog.error(kReadingFailed, shown(error));
-    kLog.error("No valid input found in plist.");
+// Reads one file. A trace point of an unknown type is taken for one of the type before it, with its
+// own codes: that is intended.
+class FileReader {
+ public:
+  FileReader(const platform::PropertyListService& lists, TraceParamsParser::Listener& listener)
+      : lists_(lists), listener_(listener) {}
+
+  TraceParams read(const std::string& path) {
+    const Dictionary root = readRoot(path);
+    for (const Value& trace : children(root, TraceParamChildrenNodes, kTracesFailed)) {
+      readTrace(element(trace, kTraceFailed));
+    }
+    return std::move(params_);
+  }
+
+ private:
+  void report(const char* what, const std::string& why) { listener_.onError(what + why); }
+
+  // The dictionary that the file holds.
+  Dictionary readRoot(const std::string& path) {
+    std::optional<Error> error;
+    const auto bytes = lists_.readFile(path, error);
+    if (!bytes.has_value()) report(kReadingFailed, shown(error));
+    error.reset();
+    const auto root = lists_.parse(bytes, error);
+    if (!root.has_value()) {
+      report(kReadingFailed, shown(error));
+      listener_.onError("No valid input found in plist.");
+      return {};
+    }
+    return root->dictionary();
+  }
+
+  Array children(const Dictionary& parent, std::string_view key, const char* failure) {
+    const Value* value = parent.find(key);
+    if (value != nullptr && value->isArray()) return value->array();
+    report(failure, kindError(value, "an array"));
     return {};
   }
-  return root->dictionary();
-}
 
-// Reads trace points one after the other. One of an unknown type is taken for one of the type
-// before it, with its own codes: that is intended.
-class TracePointReader {
- public:
-  TraceDataParams read(const Dictionary& point) {
+  Dictionary element(const Value& value, const char* failure) {
+    if (value.isDictionary()) return value.dictionary();
+    report(failure, kindError(&value, "a dictionary"));
+    return {};
+  }
+
+  void readTrace(const Dictionary& trace) {
+    if (params_.name.empty()) {
+      params_.name = textOf(trace, TraceDataDescription);
+      if (params_.name.empty()) listener_.onError("Description not found in the plist file");
+    }
+    if (params_.type == TraceType::kKernelTrace &&
+        textOf(trace, TraceDataType) == TraceDataTypeOSSignpost) {
+      params_.type = TraceType::kSignpost;
+    }
+    for (const Value& point : children(trace, TraceDataChildrenNodes, kPointsFailed)) {
+      params_.tracePoints.push_back(readPoint(element(point, kPointFailed)));
+    }
+  }
+
+  TraceDataParams readPoint(const Dictionary& point) {
     TraceDataParams params;
     params.name = textOf(point, TracePointDescription);
     params.matchByThread =
@@ -113,13 +140,11 @@ class TracePointReader {
     if (kind_ == TracePointKind::kInterval) {
       params.endCode = scanHexadecimal(textOf(point, TracePointEndCode));
     }
-    kLog.info("Loading tracepoint : ", static_cast<std::int32_t>(params.beginCode), " and ",
-              static_cast<std::int32_t>(params.endCode), " \n finished parsing.");
+    listener_.onTracePoint(params);
     if (kind_ == TracePointKind::kImpulse) params.endCode = params.beginCode;
     return params;
   }
 
- private:
   void readKind(const Dictionary& point) {
     const std::string type = textOf(point, TracePointType);
     if (type == TracePointTypeInterval) {
@@ -129,41 +154,37 @@ class TracePointReader {
     } else if (type == TracePointTypeLevel) {
       kind_ = TracePointKind::kLevel;
     } else {
-      kLog.error("TracePointType field not recognized or is empty.");
+      listener_.onError("TracePointType field not recognized or is empty.");
     }
   }
 
+  const platform::PropertyListService& lists_;
+  TraceParamsParser::Listener& listener_;
+  TraceParams params_;
   TracePointKind kind_ = TracePointKind::kImpulse;
 };
 
-void readTrace(const Dictionary& trace, TracePointReader& reader, TraceParams& params) {
-  if (params.name.empty()) {
-    params.name = textOf(trace, TraceDataDescription);
-    if (params.name.empty()) kLog.error("Description not found in the plist file");
+class LoggingListener final : public TraceParamsParser::Listener {
+ public:
+  void onError(const std::string& sentence) override { kLog.error("", sentence); }
+  void onTracePoint(const TraceDataParams& point) override {
+    kLog.info("Loading tracepoint : ", static_cast<std::int32_t>(point.beginCode), " and ",
+              static_cast<std::int32_t>(point.endCode), " \n finished parsing.");
   }
-  if (params.type == TraceType::kKernelTrace &&
-      textOf(trace, TraceDataType) == TraceDataTypeOSSignpost) {
-    params.type = TraceType::kSignpost;
-  }
-  for (const Value& point : children(trace, TraceDataChildrenNodes, kPointsFailed)) {
-    params.tracePoints.push_back(reader.read(element(point, kPointFailed)));
-  }
-}
+};
 
 }  // namespace
 
 TraceParams TraceParamsParser::loadTraceParams() const {
+  LoggingListener listener;
+  return loadTraceParams(platform::propertyLists(), listener);
+}
+
+TraceParams TraceParamsParser::loadTraceParams(const platform::PropertyListService& lists,
+                                               Listener& listener) const {
   std::string path = traceParamsFile_;
-  if (!path.starts_with('/')) {
-    path.insert(0, platform::propertyLists().currentDirectory() + "/");
-  }
-  const Dictionary root = readRoot(path);
-  TraceParams params;
-  TracePointReader reader;
-  for (const Value& trace : children(root, TraceParamChildrenNodes, kTracesFailed)) {
-    readTrace(element(trace, kTraceFailed), reader, params);
-  }
-  return params;
+  if (!path.starts_with('/')) path.insert(0, lists.currentDirectory() + "/");
+  return FileReader(lists, listener).read(path);
 }
 
 }  // namespace halvox

@@ -3,6 +3,7 @@
 #include <string>
 #include <string_view>
 
+#include "platform/property_list.h"
 #include "tracing/TraceParams.h"
 
 namespace halvox {
@@ -44,12 +45,28 @@ inline constexpr std::string_view TracePointEventsMatchedByProcess = "Process";
 // keys.
 class TraceParamsParser {
  public:
+  // What is found while a file is read, in its order.
+  class Listener {
+   public:
+    Listener() = default;
+    Listener(const Listener&) = delete;
+    Listener& operator=(const Listener&) = delete;
+    virtual ~Listener() = default;
+    // Something is missing or wrong; the sentence that the log has.
+    virtual void onError(const std::string& sentence) = 0;
+    // A trace point, with its codes as they stand in the file.
+    virtual void onTracePoint(const TraceDataParams& point) = 0;
+  };
+
   explicit TraceParamsParser(std::string fileName) : traceParamsFile_(std::move(fileName)) {}
 
   [[nodiscard]] const std::string& traceParamsFile() const { return traceParamsFile_; }
   // What the file says; no trace points when it says nothing. A relative name starts from the
   // process's current directory.
   [[nodiscard]] TraceParams loadTraceParams() const;
+  // The same for a program without the installed services: the listener gets what would be logged.
+  [[nodiscard]] TraceParams loadTraceParams(const platform::PropertyListService& lists,
+                                            Listener& listener) const;
 
  private:
   const std::string traceParamsFile_;

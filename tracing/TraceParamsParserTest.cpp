@@ -45,6 +45,32 @@ class TraceParamsParserTest : public testing::Test {
   platform::FakePlatform platform_;
 };
 
+// --- Who is told --------------------------------------------------------------------------------
+
+struct Recorder final : TraceParamsParser::Listener {
+  void onError(const std::string& sentence) override { errors.push_back(sentence); }
+  void onTracePoint(const TraceDataParams& point) override { points.push_back(point.name); }
+  Texts errors;
+  Texts points;
+};
+
+TEST_F(TraceParamsParserTest, TellsAListenerWhatItWouldLogAndLogsNothing) {
+  platform_.propertyLists.setFile(
+      kFile, Dictionary{{"Children", Array{trace("T", {interval("a", "1", "2"), Array{}})}}});
+  Recorder recorder;
+
+  const TraceParams params =
+      TraceParamsParser(kFile).loadTraceParams(platform_.propertyLists, recorder);
+
+  EXPECT_EQ(params.tracePoints.size(), 2U);
+  EXPECT_EQ(recorder.points, (Texts{"a", "(null)"}));
+  ASSERT_EQ(recorder.errors.size(), 2U);
+  EXPECT_TRUE(platform_.log.texts(LogLevel::kInfo).empty());
+  EXPECT_TRUE(errors().empty());
+  EXPECT_EQ(load({trace("T", {interval("a", "1", "2"), Array{}})}).tracePoints.size(), 2U);
+  EXPECT_EQ(errors(), recorder.errors);
+}
+
 // --- What the file says -------------------------------------------------------------------------
 
 TEST_F(TraceParamsParserTest, ReadsATraceWithAnInterval) {
