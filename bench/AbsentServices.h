@@ -155,7 +155,8 @@ class AbsentIOReport final : public IOReportService {
                                           std::optional<IOReportError>&) override {
     return nullptr;
   }
-  Samples IOReportCreateSamples(const Subscription&, const Channels&,
+  Moment makeMoment() override { return std::make_unique<platform::IOReportMoment>(); }
+  Samples IOReportCreateSamples(const Subscription&, const Channels&, platform::IOReportMoment&,
                                 std::optional<IOReportError>&) override {
     return nullptr;
   }

@@ -33,6 +33,8 @@ using Clock = std::chrono::steady_clock;
 constexpr int kChannels = 500;
 constexpr int kChannelsPerFile = 10;
 constexpr int kSessions = 64;
+// Between two measurements, so that the sources' threads sleep as they do in a service.
+constexpr std::chrono::milliseconds kPause{5};
 constexpr std::array kGroups{
     "TarnoQ7AMP", "Speaker", "MCA", "Haptics", "StateTransitionTimes_ms", "Rx", "Tx", "IOSndFam2"};
 
@@ -70,18 +72,20 @@ class Sampler {
   }
   SnapShot snapShot() const {
     SnapShot samples;
+    const auto moment = service_.makeMoment();
     std::optional<IOReportError> error;
     for (const auto& channels : channels_) {
-      samples.push_back(service_.IOReportCreateSamples(nullptr, channels, error));
+      samples.push_back(service_.IOReportCreateSamples(nullptr, channels, *moment, error));
     }
     return samples;
   }
   // Samples again, and goes through all differences.
   std::size_t report(const SnapShot& before) const {
     std::size_t count = 0;
+    const auto moment = service_.makeMoment();
     std::optional<IOReportError> error;
     for (std::size_t group = 0; group < channels_.size(); ++group) {
-      const auto now = service_.IOReportCreateSamples(nullptr, channels_[group], error);
+      const auto now = service_.IOReportCreateSamples(nullptr, channels_[group], *moment, error);
       service_.IOReportIterate(service_.IOReportCreateSamplesDelta(before[group], now, error),
                                [&count](const IOReportChannel&) {
                                  ++count;
@@ -110,11 +114,11 @@ void measureOne(const Sampler& sampler) {
   std::vector<double> snapShots;
   std::vector<double> reports;
   for (int round = 0; round < 200; ++round) {
-    std::this_thread::sleep_for(SourceReader::kMoment);
+    std::this_thread::sleep_for(kPause);
     const auto start = Clock::now();
     const SnapShot before = sampler.snapShot();
     snapShots.push_back(milliseconds(Clock::now() - start));
-    std::this_thread::sleep_for(SourceReader::kMoment);
+    std::this_thread::sleep_for(kPause);
     const auto stop = Clock::now();
     if (sampler.report(before) != kChannels) std::abort();
     reports.push_back(milliseconds(Clock::now() - stop));
@@ -170,14 +174,12 @@ void measureThreads(const Sampler& sampler) {
   tell("report, 64 threads at once", reports);
 }
 
-// Each session starts at a moment of its own, so that none shares a reading.
 void measureMemory(const Sampler& sampler) {
   std::vector<SnapShot> sessions;
   sessions.reserve(kSessions);
   static_cast<void>(sampler.snapShot());
   const std::size_t before = mallinfo2().uordblks;
   for (int session = 0; session < kSessions; ++session) {
-    std::this_thread::sleep_for(2 * SourceReader::kMoment);
     sessions.push_back(sampler.snapShot());
   }
   const std::size_t held = mallinfo2().uordblks - before;

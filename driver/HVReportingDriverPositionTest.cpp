@@ -12,9 +12,11 @@ using namespace driver_testing;
 class HVReportingDriverPositionTest : public DriverUtilityTest,
                                       public testing::WithParamInterface<std::size_t> {
  protected:
-  HVReportingDriverPositionTest() {
+  HVReportingDriverPositionTest() { setAll(1); }
+  // What each group's channel has counted.
+  void setAll(std::int64_t count) {
     for (const char* group : kGroups) {
-      platform_.ioReport.setGroup(group, {simpleChannel(group, 1)});
+      platform_.ioReport.setGroup(group, {simpleChannel(group, count)});
     }
   }
   [[nodiscard]] static std::string failing() { return kGroups[GetParam()]; }
@@ -73,6 +75,7 @@ TEST_P(HVReportingDriverPositionTest, AFailingSnapshotIsLeftOutAndTheRestIsRepor
 TEST_P(HVReportingDriverPositionTest, AFailingSampleAtTheStopIsLeftOutAndTheRestIsReported) {
   const auto utility = makeUtility();
   session_->setDriverSnapShot(utility.getSnapShot());
+  setAll(2);
   platform_.ioReport.failSamples(failing(), {-6});
 
   utility.sendDriverLogsForSession(session_);
@@ -84,6 +87,7 @@ TEST_P(HVReportingDriverPositionTest, AFailingSampleAtTheStopIsLeftOutAndTheRest
 TEST_P(HVReportingDriverPositionTest, AFailingDeltaIsLoggedLikeASampleAndTheRestIsReported) {
   const auto utility = makeUtility();
   session_->setDriverSnapShot(utility.getSnapShot());
+  setAll(2);
   platform_.ioReport.failDelta(failing(), {-8});
 
   utility.sendDriverLogsForSession(session_);

@@ -49,9 +49,10 @@ void logSampleError(const std::optional<IOReportError>& error) {
 }
 
 IOReportService::Samples createSamples(const HVReportingIOChannelSubscription& subscription,
+                                       platform::IOReportMoment& moment,
                                        std::optional<IOReportError>& error) {
-  return platform::ioReport().IOReportCreateSamples(subscription.subscription(),
-                                                    subscription.subscribedChannels(), error);
+  return platform::ioReport().IOReportCreateSamples(
+      subscription.subscription(), subscription.subscribedChannels(), moment, error);
 }
 
 // The change since the snapshot, or null. A delta that fails is reported with the text of a sample
@@ -152,11 +153,13 @@ void HVReportingDriverUtility::subscribe(const HVReportingDriver& driver) {
 
 DriverSnapShot HVReportingDriverUtility::getSnapShot() const {
   DriverSnapShot snapShot;
+  // The drivers are read once for all groups, after the session has started.
+  const auto moment = platform::ioReport().makeMoment();
   for (const auto& subscription : ioChannelSubscriptions_) {
     std::string description = subscription.driver().description();
     kDriverLog.info("sampling driver ", description);
     std::optional<IOReportError> error;
-    if (auto samples = createSamples(subscription, error)) {
+    if (auto samples = createSamples(subscription, *moment, error)) {
       snapShot.insert_or_assign(std::move(description), std::move(samples));
     } else {
       logSampleError(error);
@@ -169,10 +172,11 @@ void HVReportingDriverUtility::sendDriverLogsForSession(
     const std::shared_ptr<HVReportingSession>& session) const {
   Stats stats;
   const auto snapShot = session->driverSnapShot();
+  const auto moment = platform::ioReport().makeMoment();
   for (const auto& subscription : ioChannelSubscriptions_) {
     kDriverLog.info("getting latest samples");
     std::optional<IOReportError> error;
-    const auto current = createSamples(subscription, error);
+    const auto current = createSamples(subscription, *moment, error);
     kDriverLog.info("done getting latest samples");
     // Said after the sampling is, also of a session without a snapshot.
     if (current == nullptr) logSampleError(error);

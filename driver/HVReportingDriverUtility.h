@@ -17,7 +17,8 @@ class HVReportingSession;
 // Measures what the audio drivers counted while a session ran: a snapshot of a fixed list of
 // channel groups at its start, and the difference to it, as up to three messages, at its stop.
 //
-// Subscribes once, when it is made; a driver that shows up later is not reported. One a process,
+// Subscribes once, when it is made, to the channels that there are then: a driver, and a channel of
+// a driver, that shows up later is not reported until the service starts again. One a process,
 // owned by the service's delegate; made before any client can connect, and only read afterwards, so
 // any thread may use it. Reports no failure: a group without channels is left out for good, a
 // sample that fails is left out that one time, and both are logged.
@@ -33,11 +34,11 @@ class HVReportingDriverUtility {
     return ioChannelSubscriptions_;
   }
 
-  // Samples every subscription. Waits for the sources of the counters.
+  // Samples every subscription, all at one moment. Waits for the sources of the counters.
   [[nodiscard]] DriverSnapShot getSnapShot() const;
-  // Sends what changed since the session's snapshot through the session and to the analytics
-  // service: one message for each format that has something to tell. Does not change the snapshot;
-  // without one nothing is sent.
+  // Samples again and sends what changed since the session's snapshot, of the channels that are in
+  // it, through the session and to the analytics service: one message for each format that has
+  // something to report. Does not change the snapshot; without one nothing is sent.
   void sendDriverLogsForSession(const std::shared_ptr<HVReportingSession>& session) const;
 
   // Add one channel's entry, if it has something to tell.

@@ -119,7 +119,7 @@ TEST_F(HVReportingDriverUtilityTest, AFailingSampleIsToldAfterTheSamplingIsOver)
                    "done getting latest samples", "IOReportCreateSamples error -6"}));
 }
 
-TEST_F(HVReportingDriverUtilityTest, TheReportIsOfTheSamplesAtTheStop) {
+TEST_F(HVReportingDriverUtilityTest, TheReportIsTheDifferenceFromTheSnapshotToTheStop) {
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
   const auto utility = makeUtility();
   session_->setDriverSnapShot(utility.getSnapShot());
@@ -128,7 +128,69 @@ TEST_F(HVReportingDriverUtilityTest, TheReportIsOfTheSamplesAtTheStop) {
   utility.sendDriverLogsForSession(session_);
 
   ASSERT_EQ(recorded().size(), 1U);
-  EXPECT_EQ(recorded()[0].find("Amp_Speaker_Simple_a")->toInt64(), 5);
+  EXPECT_EQ(recorded()[0].find("Amp_Speaker_Simple_a")->toInt64(), 4);
+}
+
+TEST_F(HVReportingDriverUtilityTest, AChannelThatDidNotGrowOrFellIsNotSent) {
+  Channel gauge = simpleChannel("gauge", 100);
+  gauge.kind = platform::IOReportKind::kGauge;
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("still", 7), gauge});
+  const auto utility = makeUtility();
+  session_->setDriverSnapShot(utility.getSnapShot());
+  gauge.integerValue = 40;
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("still", 7), gauge});
+
+  utility.sendDriverLogsForSession(session_);
+
+  EXPECT_TRUE(recorded().empty());
+}
+
+TEST_F(HVReportingDriverUtilityTest, AChannelThatIsNotInTheSnapshotIsNotSent) {
+  const Channel other = simpleChannel("b", 100);
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1), other});
+  const auto utility = makeUtility();
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
+  session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 5), other});
+
+  utility.sendDriverLogsForSession(session_);
+
+  ASSERT_EQ(recorded().size(), 1U);
+  EXPECT_EQ(recorded()[0],
+            (Dictionary{{"Amp_Speaker_Simple_a", 4}, {"audiotag", "IOReportingSimple"}}));
+}
+
+// The groups are asked for one after the other, and a driver may count in between.
+TEST_F(HVReportingDriverUtilityTest, AllGroupsOfASnapshotAreOfOneMoment) {
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
+  platform_.ioReport.setGroup("Tx-(null)", {simpleChannel("b", 1)});
+  const auto utility = makeUtility();
+  platform_.ioReport.afterSamples([this](const std::string& group) {
+    if (group == "Speaker-(null)")
+      platform_.ioReport.setGroup("Tx-(null)", {simpleChannel("b", 5)});
+  });
+
+  session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.ioReport.afterSamples(nullptr);
+  utility.sendDriverLogsForSession(session_);
+
+  ASSERT_EQ(recorded().size(), 1U);
+  EXPECT_EQ(recorded()[0].find("Amp_Speaker_Simple_b")->toInt64(), 4);
+}
+
+TEST_F(HVReportingDriverUtilityTest, AllGroupsOfAReportAreOfOneMoment) {
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
+  platform_.ioReport.setGroup("Tx-(null)", {simpleChannel("b", 1)});
+  const auto utility = makeUtility();
+  session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.ioReport.afterSamples([this](const std::string& group) {
+    if (group == "Speaker-(null)")
+      platform_.ioReport.setGroup("Tx-(null)", {simpleChannel("b", 5)});
+  });
+
+  utility.sendDriverLogsForSession(session_);
+
+  EXPECT_TRUE(recorded().empty());
 }
 
 TEST_F(HVReportingDriverUtilityTest, SessionsAtOnceEachHaveTheirOwnSnapshot) {
@@ -138,12 +200,14 @@ TEST_F(HVReportingDriverUtilityTest, SessionsAtOnceEachHaveTheirOwnSnapshot) {
       ReporterID{8}, HVReportingSession::ProcessIdentifiers{12});
   other->start();
   session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 3)});
 
   utility.sendDriverLogsForSession(other);
   EXPECT_TRUE((*other->nestedAggregatedPayloadData())->empty());
   utility.sendDriverLogsForSession(session_);
 
-  EXPECT_EQ(recorded().size(), 1U);
+  ASSERT_EQ(recorded().size(), 1U);
+  EXPECT_EQ(recorded()[0].find("Amp_Speaker_Simple_a")->toInt64(), 2);
 }
 
 TEST_F(HVReportingDriverUtilityTest, GroupThatIsNotInTheSnapshotIsLeftOutSilently) {
@@ -160,13 +224,16 @@ TEST_F(HVReportingDriverUtilityTest, GroupThatIsNotInTheSnapshotIsLeftOutSilentl
 TEST_F(HVReportingDriverUtilityTest, EachFormatGetsItsMessageFromAllGroups) {
   Channel histogram = simpleChannel("h", 0);
   histogram.format = IOReportFormat::kHistogram;
-  histogram.buckets = {{0, 10, 1}};
+  histogram.buckets = {{0, 10, 3}};
   Channel state = simpleChannel("s", 0);
   state.format = IOReportFormat::kState;
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1), state});
   platform_.ioReport.setGroup("Tx-(null)", {histogram, simpleChannel("b", 2)});
   const auto utility = makeUtility();
   session_->setDriverSnapShot(utility.getSnapShot());
+  histogram.buckets[0].hits = 4;
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 2), state});
+  platform_.ioReport.setGroup("Tx-(null)", {histogram, simpleChannel("b", 4)});
   forgetWhatHappened();
 
   utility.sendDriverLogsForSession(session_);
@@ -176,10 +243,9 @@ TEST_F(HVReportingDriverUtilityTest, EachFormatGetsItsMessageFromAllGroups) {
   EXPECT_EQ(messages[0], (Dictionary{{"Amp_Speaker_Simple_a", 1},
                                      {"Amp_Speaker_Simple_b", 2},
                                      {"audiotag", "IOReportingSimple"}}));
-  EXPECT_EQ(
-      messages[1],
-      (Dictionary{{"Amp_Speaker_Histogram_h", "count=1,lower=0,upper=10,min=0,max=0,unit=::0-10:1"},
-                  {"audiotag", "IOReportingHistogram"}}));
+  EXPECT_EQ(messages[1], (Dictionary{{"Amp_Speaker_Histogram_h",
+                                      "count=1,lower=0,upper=10,min=0,max=10,unit=::0-10:1"},
+                                     {"audiotag", "IOReportingHistogram"}}));
   EXPECT_EQ(messages[2],
             (Dictionary{{"Amp_Speaker_State_s", ""}, {"audiotag", "IOReportingState"}}));
   EXPECT_EQ(
@@ -223,6 +289,7 @@ TEST_F(HVReportingDriverUtilityTest, FormatsThatAreNotReportedAreLoggedAndSkippe
   platform_.ioReport.setGroup("Speaker-(null)", {invalid, list, unknown, simpleChannel("a", 4)});
   const auto utility = makeUtility();
   session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.ioReport.setGroup("Speaker-(null)", {invalid, list, unknown, simpleChannel("a", 5)});
 
   utility.sendDriverLogsForSession(session_);
 
@@ -241,6 +308,7 @@ TEST_F(HVReportingDriverUtilityTest, EachMessageGoesToTheSessionThenToAnalytics)
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1), state});
   const auto utility = makeUtility();
   session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 2), state});
   platform_.analytics.wantOnly({"com.tarno.halvox.IOReporting.Simple"});
   forgetWhatHappened();
 

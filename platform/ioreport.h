@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <limits>
 #include <memory>
 #include <optional>
 #include <span>
@@ -19,6 +20,10 @@ enum class IOReportFormat : std::uint8_t {
   kSimpleArray = 4,
 };
 
+// What the value of a simple channel does: a counter only grows, until it is reset and begins at
+// zero again; a gauge goes up and down.
+enum class IOReportKind : std::uint8_t { kGauge, kCounter };
+
 struct IOReportError {
   std::int64_t code = 0;
 };
@@ -30,6 +35,9 @@ struct IOReportState {
   std::uint64_t residency = 0;      // how long it held, in the channel's unit
   double dutyCycle = 0;
 };
+
+// The upper bound of a bucket that has none.
+inline constexpr std::int64_t kIOReportNoUpperBound = std::numeric_limits<std::int64_t>::max();
 
 // One bucket of a histogram channel: how often a value was from `lower` on and below `upper`.
 struct IOReportBucket {
@@ -121,7 +129,7 @@ inline std::int64_t IOReportHistogramGetMaxValue(const IOReportChannel& channel)
   return channel.maxValue;
 }
 
-// A set of channels. Immutable, shared.
+// A set of channels: which these were when the set was made. Immutable, shared.
 class IOReportChannels {
  public:
   virtual ~IOReportChannels() = default;
@@ -140,20 +148,36 @@ class IOReportSamples {
   virtual ~IOReportSamples() = default;
 };
 
+// One moment at which several subscriptions are sampled. Owned by its maker and used by one thread
+// at a time. Samples may outlive it; it must not outlive the service.
+class IOReportMoment {
+ public:
+  IOReportMoment() = default;
+  IOReportMoment(const IOReportMoment&) = delete;
+  IOReportMoment& operator=(const IOReportMoment&) = delete;
+  virtual ~IOReportMoment() = default;
+};
+
 // What the drivers count. Any thread may call. What comes back is null when there is nothing; then
 // `error` may tell why, and is left alone otherwise.
+//
+// A channel is the same in two samples when its names, format, unit, states and buckets are the
+// same and the driver did not withdraw it in between. A simple channel is a counter or a gauge, by
+// what the driver says of it, and that is part of what it is.
 class IOReportService {
  public:
   using Channels = std::shared_ptr<const IOReportChannels>;
   using Subscription = std::shared_ptr<IOReportSubscription>;
   using Samples = std::shared_ptr<const IOReportSamples>;
+  using Moment = std::unique_ptr<IOReportMoment>;
   using Name = std::optional<std::string_view>;  // none: any
   // Returns 0 to go on.
   using Visitor = std::function<int(const IOReportChannel&)>;
 
   virtual ~IOReportService() = default;
 
-  // The channels of all drivers in that group and subgroup.
+  // The channels that all drivers have now in that group and subgroup; null or an empty set when
+  // there are none.
   virtual Channels IOReportCopyChannelsInGroup(Name group, Name subGroup,
                                                std::optional<IOReportError>& error) = 0;
   [[nodiscard]] virtual std::int32_t IOReportGetChannelCount(const Channels& channels) const = 0;
@@ -161,10 +185,28 @@ class IOReportService {
   virtual Subscription IOReportCreateSubscription(const Channels& channels,
                                                   Channels& subscribedChannels,
                                                   std::optional<IOReportError>& error) = 0;
-  // Reads the counters. May take as long as the slowest source is allowed to.
+  // Never null. Reads nothing by itself.
+  [[nodiscard]] virtual Moment makeMoment() = 0;
+  // The values of those of the channels that there are. A channel that comes later than the set was
+  // made is not sampled; one of the set that goes and comes again, by its names and format, is.
+  // The first samples of a moment read the counters, and no reading is used that was begun before
+  // that call; all other samples of the moment are of the same reading. May take as long as the
+  // slowest source is allowed to.
   virtual Samples IOReportCreateSamples(const Subscription& subscription, const Channels& channels,
+                                        IOReportMoment& moment,
                                         std::optional<IOReportError>& error) = 0;
-  // What changed from the previous samples to the current ones.
+  // What changed from the previous samples to the current ones, of the channels that are in both; a
+  // channel that is in one only is left out. The difference
+  //   of a gauge      is the current value less the previous one, at most what 64 bits hold;
+  //   of a counter    is that too, and, when it is lower than before, the current value: it was
+  //                   reset and has counted that since;
+  //   of a state      are those of its transitions and residencies; the duty cycle is the state's
+  //                   share of all residencies between the two;
+  //   of a histogram  are those of its hits; minimum and maximum are the lower bound of the lowest
+  //                   and the upper bound of the highest bucket with hits between the two, of an
+  //                   open bucket its lower bound.
+  // When one number of a state or histogram channel is lower than before, all of it was reset.
+  // Null without previous samples.
   virtual Samples IOReportCreateSamplesDelta(const Samples& previous, const Samples& current,
                                              std::optional<IOReportError>& error) = 0;
   // Shows the visitor each channel until it returns something else than 0.

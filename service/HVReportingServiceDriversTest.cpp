@@ -14,13 +14,18 @@ class HVReportingServiceDriversTest : public ServiceTest {
  protected:
   // A service that found channels at its start.
   HVReportingServiceDriversTest() {
-    platform_.ioReport.setGroup(
-        "Speaker-(null)",
-        {{.driverName = "Amp", .group = "Speaker", .channelName = "cycles", .integerValue = 5}});
+    setCycles(5);
     delegate_ = std::make_shared<HVReportingServiceDelegate>();
     platform_.connections.serviceListener().setDelegate(*delegate_);
     client_ = connect(100);
     forgetSteps();
+  }
+  // What the one channel has counted.
+  void setCycles(std::int64_t cycles) {
+    platform_.ioReport.setGroup("Speaker-(null)", {{.driverName = "Amp",
+                                                    .group = "Speaker",
+                                                    .channelName = "cycles",
+                                                    .integerValue = cycles}});
   }
   Texts operations() const { return platform_.journal.texts(JournalKind::kNote); }
   // The steps that are named, in the order in which they happened.
@@ -56,6 +61,7 @@ TEST_F(HVReportingServiceDriversTest, SecondStartDoesNotSampleAgain) {
 
 TEST_F(HVReportingServiceDriversTest, StopTellsTheDifferenceBeforeTheSessionEnds) {
   createAndStart(client_, 7);
+  setCycles(12);
   forgetSteps();
 
   stop(client_, 7);
@@ -65,7 +71,7 @@ TEST_F(HVReportingServiceDriversTest, StopTellsTheDifferenceBeforeTheSessionEnds
   EXPECT_EQ(sessionOf(client_, 7)->driverSnapShot(), std::nullopt);
   const auto events = platform_.analytics.events("com.tarno.halvox.IOReporting.Simple");
   ASSERT_EQ(events.size(), 1U);
-  EXPECT_EQ(events[0].payload->find("Amp_Speaker_Simple_cycles")->toInt64(), 5);
+  EXPECT_EQ(events[0].payload->find("Amp_Speaker_Simple_cycles")->toInt64(), 7);
   EXPECT_EQ(order({"done getting latest samples", "ending session 7"}),
             (Texts{"done getting latest samples", "ending session 7", "ending session 7"}));
 }

@@ -59,8 +59,9 @@ std::string textOf(const IOReportChannel& channel, std::optional<double> seconds
   }
   for (const auto& bucket : channel.buckets) {
     if (bucket.hits == 0) continue;
-    text += " " + std::to_string(bucket.lower) + "-" + std::to_string(bucket.upper) + ":" +
-            count(bucket.hits, seconds);
+    const bool isOpen = bucket.upper == platform::kIOReportNoUpperBound;
+    text += " " + std::to_string(bucket.lower) + "-" +
+            (isOpen ? "+Inf" : std::to_string(bucket.upper)) + ":" + count(bucket.hits, seconds);
   }
   return text.empty() ? " 0" : text;
 }
@@ -133,7 +134,7 @@ class DriverPrinter {
 
   IOReportService::Samples sample() {
     std::optional<platform::IOReportError> error;
-    return service_.IOReportCreateSamples(subscription_, channels_, error);
+    return service_.IOReportCreateSamples(subscription_, channels_, *service_.makeMoment(), error);
   }
 
   void print(const IOReportService::Samples& samples, std::optional<double> seconds) {

@@ -65,6 +65,16 @@ TEST(DriversTest, StatesAndBucketsAreShownWithWhatTheyCounted) {
   EXPECT_EQ(formatChannel(histogram, std::nullopt, OutputForm::kText), "-  -  -  -  0-10:5");
 }
 
+TEST(DriversTest, ABucketWithoutAnUpperBoundEndsAtInfinity) {
+  const std::array buckets{
+      IOReportBucket{.lower = 20, .upper = platform::kIOReportNoUpperBound, .hits = 3}};
+  IOReportChannel histogram;
+  histogram.format = IOReportFormat::kHistogram;
+  histogram.buckets = buckets;
+
+  EXPECT_EQ(formatChannel(histogram, std::nullopt, OutputForm::kText), "-  -  -  -  20-+Inf:3");
+}
+
 class ShowDriversTest : public testing::Test {
  protected:
   ShowDriversTest() {

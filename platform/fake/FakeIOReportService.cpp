@@ -1,15 +1,22 @@
 #include "platform/fake/FakeIOReportService.h"
 
+#include <algorithm>
 #include <utility>
+
+#include "platform/fake/FakeIOReportDelta.h"
 
 namespace halvox::platform {
 namespace {
 
-// Channels, subscriptions and samples of the fake are all the name of the group that they are of.
+using ChannelList = FakeIOReportService::ChannelList;
+
+// Channels, subscriptions and samples of the fake know the name of the group that they are of.
 class NamedChannels final : public IOReportChannels {
  public:
-  explicit NamedChannels(std::string group) : name(std::move(group)) {}
+  NamedChannels(std::string group, ChannelList content)
+      : name(std::move(group)), channels(std::move(content)) {}
   const std::string name;
+  const ChannelList channels;
 };
 
 class NamedSubscription final : public IOReportSubscription {
@@ -20,10 +27,10 @@ class NamedSubscription final : public IOReportSubscription {
 
 class NamedSamples final : public IOReportSamples {
  public:
-  NamedSamples(std::string group, std::vector<FakeIOReportService::Channel> content)
+  NamedSamples(std::string group, ChannelList content)
       : name(std::move(group)), channels(std::move(content)) {}
   const std::string name;
-  const std::vector<FakeIOReportService::Channel> channels;
+  const ChannelList channels;
 };
 
 template <typename Named, typename Pointer>
@@ -37,6 +44,12 @@ std::optional<std::string_view> view(const std::optional<std::string>& text) {
 }
 
 }  // namespace
+
+// What all groups had counted when the first of them was sampled.
+class FakeIOReportService::ReadMoment final : public IOReportMoment {
+ public:
+  std::optional<Groups> groups;
+};
 
 IOReportChannel FakeIOReportService::Channel::view() const {
   return {.format = format,
@@ -52,9 +65,14 @@ IOReportChannel FakeIOReportService::Channel::view() const {
           .maxValue = maxValue};
 }
 
-void FakeIOReportService::setGroup(std::string_view name, std::vector<Channel> channels) {
+void FakeIOReportService::setGroup(std::string_view name, ChannelList channels) {
   const std::lock_guard lock(mutex_);
   groups_.insert_or_assign(std::string(name), std::move(channels));
+}
+
+void FakeIOReportService::afterSamples(std::function<void(const std::string& group)> change) {
+  const std::lock_guard lock(mutex_);
+  afterSamples_ = std::move(change);
 }
 
 void FakeIOReportService::failChannels(std::string_view name, Failure failure) {
@@ -100,13 +118,13 @@ IOReportService::Channels FakeIOReportService::IOReportCopyChannelsInGroup(
   if (const auto added = addedErrors_.find(name); added != addedErrors_.end()) {
     error = IOReportError{added->second};
   }
-  if (!groups_.contains(name)) return nullptr;
-  return std::make_shared<NamedChannels>(name);
+  const auto found = groups_.find(name);
+  if (found == groups_.end()) return nullptr;
+  return std::make_shared<NamedChannels>(name, found->second);
 }
 
 std::int32_t FakeIOReportService::IOReportGetChannelCount(const Channels& channels) const {
-  const std::lock_guard lock(mutex_);
-  return static_cast<std::int32_t>(groups_.at(named<NamedChannels>(channels).name).size());
+  return static_cast<std::int32_t>(named<NamedChannels>(channels).channels.size());
 }
 
 IOReportService::Subscription FakeIOReportService::IOReportCreateSubscription(
@@ -119,23 +137,37 @@ IOReportService::Subscription FakeIOReportService::IOReportCreateSubscription(
   return std::make_shared<NamedSubscription>(name);
 }
 
+IOReportService::Moment FakeIOReportService::makeMoment() { return std::make_unique<ReadMoment>(); }
+
 IOReportService::Samples FakeIOReportService::IOReportCreateSamples(
-    const Subscription& subscription, const Channels& channels,
+    const Subscription& subscription, const Channels& channels, IOReportMoment& moment,
     std::optional<IOReportError>& error) {
   const std::string& name = named<NamedSubscription>(subscription).name;
-  journal_.note("samples " + named<NamedChannels>(channels).name);
-  const std::lock_guard lock(mutex_);
+  const auto& subscribed = named<NamedChannels>(channels);
+  journal_.note("samples " + subscribed.name);
+  std::unique_lock lock(mutex_);
   if (fails(sampleFailures_, name, error)) return nullptr;
-  return std::make_shared<NamedSamples>(name, groups_.at(name));
+  auto& read = dynamic_cast<ReadMoment&>(moment).groups;
+  if (!read.has_value()) read = groups_;
+  ChannelList sampled;
+  for (const Channel& channel : read->at(name)) {
+    const auto isIt = [&channel](const Channel& one) { return areNamedAlike(one, channel); };
+    if (std::ranges::any_of(subscribed.channels, isIt)) sampled.push_back(channel);
+  }
+  const auto change = afterSamples_;
+  lock.unlock();
+  if (change) change(name);
+  return std::make_shared<NamedSamples>(name, std::move(sampled));
 }
 
 IOReportService::Samples FakeIOReportService::IOReportCreateSamplesDelta(
     const Samples& previous, const Samples& current, std::optional<IOReportError>& error) {
-  const std::string& name = named<NamedSamples>(current).name;
-  journal_.note("delta " + name);
+  const auto& now = named<NamedSamples>(current);
+  journal_.note("delta " + now.name);
   const std::lock_guard lock(mutex_);
-  if (fails(deltaFailures_, name, error) || previous == nullptr) return nullptr;
-  return current;
+  if (fails(deltaFailures_, now.name, error) || previous == nullptr) return nullptr;
+  return std::make_shared<NamedSamples>(
+      now.name, differences(named<NamedSamples>(previous).channels, now.channels));
 }
 
 void FakeIOReportService::IOReportIterate(const Samples& samples, const Visitor& visitor) const {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <map>
 #include <mutex>
 #include <string>
@@ -12,12 +13,14 @@
 namespace halvox::platform {
 
 // Driver counters that a test makes up. Groups are named as "Speaker-(null)": group, "-",
-// subgroup. Notes each operation and the group that it is for in the journal. Any thread may call.
+// subgroup. Samples are copies of what the test set last, and differences are computed from them.
+// Notes each operation and the group that it is for in the journal. Any thread may call.
 class FakeIOReportService final : public IOReportService {
  public:
   // A channel with what it owns.
   struct Channel {
     IOReportFormat format = IOReportFormat::kSimple;
+    IOReportKind kind = IOReportKind::kCounter;  // of a simple channel
     std::optional<std::string> driverName{};
     std::optional<std::string> group{};
     std::optional<std::string> subGroup{};
@@ -31,6 +34,7 @@ class FakeIOReportService final : public IOReportService {
 
     [[nodiscard]] IOReportChannel view() const;
   };
+  using ChannelList = std::vector<Channel>;
   // How an operation ends instead of well: without a result, and with that error if there is one.
   struct Failure {
     std::optional<std::int64_t> code{};
@@ -39,8 +43,11 @@ class FakeIOReportService final : public IOReportService {
   // Does not own the journal, which must outlive it.
   explicit FakeIOReportService(Journal& journal) : journal_(journal) {}
 
-  // From now on there is that group, with channels whose differences are these.
-  void setGroup(std::string_view name, std::vector<Channel> channels);
+  // From now on there is that group, and its channels have counted that much. A test that changes
+  // what they counted sets the group again.
+  void setGroup(std::string_view name, ChannelList channels);
+  // Is called after each group's samples, as a driver that counts in the meantime; null: no more.
+  void afterSamples(std::function<void(const std::string& group)> change);
   // How operations on that group fail from now on.
   void failChannels(std::string_view name, Failure failure);
   void failSubscription(std::string_view name, Failure failure);
@@ -54,22 +61,26 @@ class FakeIOReportService final : public IOReportService {
   [[nodiscard]] std::int32_t IOReportGetChannelCount(const Channels& channels) const override;
   Subscription IOReportCreateSubscription(const Channels& channels, Channels& subscribedChannels,
                                           std::optional<IOReportError>& error) override;
+  [[nodiscard]] Moment makeMoment() override;
   Samples IOReportCreateSamples(const Subscription& subscription, const Channels& channels,
+                                IOReportMoment& moment,
                                 std::optional<IOReportError>& error) override;
-  // The differences that the test set, whatever the samples; none without both samples.
   Samples IOReportCreateSamplesDelta(const Samples& previous, const Samples& current,
                                      std::optional<IOReportError>& error) override;
   void IOReportIterate(const Samples& samples, const Visitor& visitor) const override;
 
  private:
+  using Groups = std::map<std::string, ChannelList, std::less<>>;
   using Failures = std::map<std::string, Failure, std::less<>>;
+  class ReadMoment;
 
   bool fails(const Failures& failures, const std::string& name,
              std::optional<IOReportError>& error) const;
 
   Journal& journal_;
   mutable std::mutex mutex_;
-  std::map<std::string, std::vector<Channel>, std::less<>> groups_;
+  Groups groups_;
+  std::function<void(const std::string&)> afterSamples_;
   Failures channelFailures_;
   Failures subscriptionFailures_;
   Failures sampleFailures_;

@@ -6,19 +6,26 @@ namespace halvox::platform::linux_ {
 
 std::size_t ChannelDescription::valueCount() const {
   constexpr std::size_t kNumbersOfState = 2;
-  constexpr std::size_t kMinimumAndMaximum = 2;
   switch (format) {
     case IOReportFormat::kSimple:
       return 1;
     case IOReportFormat::kState:
       return kNumbersOfState * states.size();
     case IOReportFormat::kHistogram:
-      return buckets.size() + kMinimumAndMaximum;
+      return buckets.size();
     case IOReportFormat::kInvalid:
     case IOReportFormat::kSimpleArray:
       return 0;
   }
   return 0;
+}
+
+std::string ChannelDescription::fullName() const {
+  std::string name = std::to_string(static_cast<int>(format));
+  for (const auto* part : {&driverName, &group, &subGroup, &channelName}) {
+    name += part->has_value() ? '\n' + std::to_string((*part)->size()) + ':' + **part : "\n-";
+  }
+  return name;
 }
 
 ChannelList::ChannelList(std::vector<Channel> channels) : channels_(std::move(channels)) {

@@ -22,6 +22,9 @@ struct BucketBounds {
 // Immutable; shared by the source and all readings.
 struct ChannelDescription {
   IOReportFormat format = IOReportFormat::kSimple;
+  // Of a simple channel. What says nothing else is a gauge, of which a fall is never taken for a
+  // reset.
+  IOReportKind kind = IOReportKind::kGauge;
   std::optional<std::string> driverName{};
   std::optional<std::string> group{};
   std::optional<std::string> subGroup{};
@@ -31,8 +34,10 @@ struct ChannelDescription {
   std::vector<BucketBounds> buckets{};  // of a histogram channel
 
   // How many numbers a channel's value is: one of a simple channel; transitions and residency of
-  // each state; the hits of each bucket, then minimum and maximum.
+  // each state; the hits of each bucket.
   [[nodiscard]] std::size_t valueCount() const;
+  // The format and the four names in one text, which no two channels of a report share.
+  [[nodiscard]] std::string fullName() const;
   friend bool operator==(const ChannelDescription&, const ChannelDescription&) = default;
 };
 

@@ -1,6 +1,6 @@
 #include "platform/linux/drivers/DriverSamples.h"
 
-#include <algorithm>
+#include <limits>
 #include <span>
 #include <unordered_map>
 #include <utility>
@@ -20,19 +20,6 @@ std::int64_t asSigned(std::uint64_t number) { return static_cast<std::int64_t>(n
 Numbers valuesOf(const Reading& reading, std::size_t index) {
   const ChannelList& channels = *reading.channels;
   return Numbers(reading.values).subspan(channels.offset(index), channels[index]->valueCount());
-}
-
-// How many of a channel's numbers only grow: all but the minimum and maximum of a histogram.
-std::size_t countedNumbers(const ChannelDescription& channel) {
-  return channel.format == IOReportFormat::kHistogram ? channel.buckets.size()
-                                                      : channel.valueCount();
-}
-
-// A simple channel may be any signed number; all others count up from zero.
-bool wentBackwards(const ChannelDescription& channel, std::uint64_t previous,
-                   std::uint64_t current) {
-  return channel.format == IOReportFormat::kSimple ? asSigned(current) < asSigned(previous)
-                                                   : current < previous;
 }
 
 std::vector<IOReportState> statesOf(const ChannelDescription& channel, Numbers values) {
@@ -65,6 +52,24 @@ std::vector<IOReportBucket> bucketsOf(const ChannelDescription& channel, Numbers
   return buckets;
 }
 
+struct Extremes {
+  std::int64_t minimum = 0;
+  std::int64_t maximum = 0;
+};
+
+// The bounds of the lowest and of the highest bucket with hits. What is in an open bucket is known
+// to be no lower than where it begins, and nothing more.
+Extremes extremesOf(std::span<const IOReportBucket> buckets) {
+  Extremes extremes;
+  bool isFirst = true;
+  for (const IOReportBucket& bucket : buckets) {
+    if (bucket.hits == 0) continue;
+    if (std::exchange(isFirst, false)) extremes.minimum = bucket.lower;
+    extremes.maximum = bucket.upper == kIOReportNoUpperBound ? bucket.lower : bucket.upper;
+  }
+  return extremes;
+}
+
 int show(const ChannelDescription& channel, Numbers values,
          const IOReportService::Visitor& visitor) {
   IOReportChannel shown{.format = channel.format,
@@ -82,9 +87,10 @@ int show(const ChannelDescription& channel, Numbers values,
     shown.states = states;
   } else if (channel.format == IOReportFormat::kHistogram) {
     buckets = bucketsOf(channel, values);
+    const Extremes extremes = extremesOf(buckets);
     shown.buckets = buckets;
-    shown.minValue = asSigned(values[channel.buckets.size()]);
-    shown.maxValue = asSigned(values[channel.buckets.size() + 1]);
+    shown.minValue = extremes.minimum;
+    shown.maxValue = extremes.maximum;
   }
   return visitor(shown);
 }
@@ -94,7 +100,7 @@ using ValuesByChannel = std::unordered_map<const ChannelDescription*, Numbers>;
 
 ValuesByChannel index(const DriverSamples& samples) {
   ValuesByChannel values;
-  for (const auto& [reading, selection, source] : samples.parts()) {
+  for (const auto& [reading, selection] : samples.parts()) {
     for (const std::uint32_t position : *selection) {
       values.emplace((*reading->channels)[position].get(), valuesOf(*reading, position));
     }
@@ -102,27 +108,36 @@ ValuesByChannel index(const DriverSamples& samples) {
   return values;
 }
 
+// At most what 64 bits hold: a difference that wrapped would turn a fall into a rise.
+std::uint64_t gaugeDifference(std::uint64_t previous, std::uint64_t current) {
+  std::int64_t difference = 0;
+  if (__builtin_sub_overflow(asSigned(current), asSigned(previous), &difference)) {
+    difference = asSigned(current) < asSigned(previous) ? std::numeric_limits<std::int64_t>::min()
+                                                        : std::numeric_limits<std::int64_t>::max();
+  }
+  return static_cast<std::uint64_t>(difference);
+}
+
 void appendDifference(const ChannelDescription& channel, Numbers previous, Numbers current,
                       std::vector<std::uint64_t>& differences) {
-  const std::size_t counted = countedNumbers(channel);
-  bool isContinued = !previous.empty();
-  for (std::size_t number = 0; isContinued && number < counted; ++number) {
-    isContinued = !wentBackwards(channel, previous[number], current[number]);
+  if (channel.format == IOReportFormat::kSimple && channel.kind == IOReportKind::kGauge) {
+    differences.push_back(gaugeDifference(previous[0], current[0]));
+    return;
+  }
+  // The numbers of a channel belong together: one that was reset was reset as a whole.
+  bool isReset = false;
+  for (std::size_t number = 0; number < current.size(); ++number) {
+    isReset |= current[number] < previous[number];
   }
   for (std::size_t number = 0; number < current.size(); ++number) {
-    const std::uint64_t base = isContinued && number < counted ? previous[number] : 0;
-    differences.push_back(current[number] - base);
+    differences.push_back(isReset ? current[number] : current[number] - previous[number]);
   }
 }
 
 }  // namespace
 
-bool DriverSamples::wasLate(std::size_t source) const {
-  return std::ranges::find(late_, source) != late_.end();
-}
-
 void DriverSamples::iterate(const IOReportService::Visitor& visitor) const {
-  for (const auto& [reading, selection, source] : parts_) {
+  for (const auto& [reading, selection] : parts_) {
     for (const std::uint32_t position : *selection) {
       if (show(*(*reading->channels)[position], valuesOf(*reading, position), visitor) != 0) return;
     }
@@ -134,13 +149,12 @@ std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
   const ValuesByChannel before = index(previous);
   std::vector<ChannelList::Channel> channels;
   auto reading = std::make_shared<Reading>();
-  for (const auto& [now, selection, source] : current.parts()) {
-    if (previous.wasLate(source)) continue;
+  for (const auto& [now, selection] : current.parts()) {
     for (const std::uint32_t position : *selection) {
       const ChannelList::Channel& channel = (*now->channels)[position];
       const auto found = before.find(channel.get());
-      appendDifference(*channel, found == before.end() ? Numbers() : found->second,
-                       valuesOf(*now, position), reading->values);
+      if (found == before.end()) continue;
+      appendDifference(*channel, found->second, valuesOf(*now, position), reading->values);
       channels.push_back(channel);
     }
   }

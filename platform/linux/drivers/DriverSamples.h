@@ -19,28 +19,20 @@ class DriverSamples final : public IOReportSamples {
   struct Part {
     std::shared_ptr<const Reading> reading;
     std::shared_ptr<const ChannelSelection> selection;
-    std::size_t source = 0;  // the number of the one that was read
   };
-  using Sources = std::vector<std::size_t>;
 
-  // `late` are the sources whose readings did not come in time.
-  explicit DriverSamples(std::vector<Part> parts, Sources late = {})
-      : parts_(std::move(parts)), late_(std::move(late)) {}
+  explicit DriverSamples(std::vector<Part> parts) : parts_(std::move(parts)) {}
 
   [[nodiscard]] const std::vector<Part>& parts() const { return parts_; }
-  [[nodiscard]] bool wasLate(std::size_t source) const;
   void iterate(const IOReportService::Visitor& visitor) const;
 
  private:
   const std::vector<Part> parts_;
-  const Sources late_;
 };
 
-// What changed from one to the other, channel by channel of the current ones. Counts, hits,
-// transitions and residencies are differences; minimum and maximum are the current ones. A channel
-// that is new, or that has a number lower than before, counts from zero as a whole; one that is
-// gone is left out, and so are all of a source that was late before: what they counted by then is
-// not known.
+// What changed from one to the other, of the channels that are in both: what a channel counted
+// before it was first sampled is not known, nor is what a source counted that was late. The
+// differences are those that IOReportCreateSamplesDelta promises.
 [[nodiscard]] std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
                                                              const DriverSamples& current);
 

@@ -28,10 +28,18 @@ class MadeSource final : public DriverSource {
   const Make make_;
 };
 
+// A counter.
 inline ChannelList::Channel simpleChannel(std::string group, std::string name) {
   ChannelDescription channel;
+  channel.kind = IOReportKind::kCounter;
   channel.group = std::move(group);
   channel.channelName = std::move(name);
+  return std::make_shared<const ChannelDescription>(std::move(channel));
+}
+
+inline ChannelList::Channel gaugeChannel(std::string group, std::string name) {
+  ChannelDescription channel = *simpleChannel(std::move(group), std::move(name));
+  channel.kind = IOReportKind::kGauge;
   return std::make_shared<const ChannelDescription>(std::move(channel));
 }
 

@@ -1,6 +1,9 @@
 #include "platform/linux/drivers/LinuxIOReportService.h"
 
+#include <algorithm>
+#include <optional>
 #include <string>
+#include <unordered_set>
 #include <utility>
 
 #include "platform/linux/Mutex.h"
@@ -9,20 +12,59 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The channels of a group that a source has, found anew only when the source's channels change.
-class GroupSelection {
- public:
-  GroupSelection(IOReportService::Name group, IOReportService::Name subGroup, std::size_t sources)
-      : group_(group), subGroup_(subGroup), found_(sources) {}
+using Readers = std::vector<std::unique_ptr<SourceReader>>;
+using Readings = std::vector<std::shared_ptr<const Reading>>;  // by source; null: late
 
-  // The part of a source's reading that is in the group.
-  DriverSamples::Part select(std::size_t source, std::shared_ptr<const Reading> reading) {
+// Reads all sources at once.
+Readings read(const Readers& readers, std::chrono::milliseconds longestWait) {
+  std::vector<SourceReader::Asked> asked;
+  asked.reserve(readers.size());
+  for (const auto& reader : readers) asked.push_back(reader->ask(longestWait));
+  Readings readings;
+  readings.reserve(readers.size());
+  for (std::size_t source = 0; source < readers.size(); ++source) {
+    readings.push_back(readers[source]->take(asked[source]));
+  }
+  return readings;
+}
+
+struct GroupName {
+  std::optional<std::string> group;
+  std::optional<std::string> subGroup;
+
+  [[nodiscard]] bool has(const ChannelDescription& channel) const {
+    return (!group.has_value() || channel.group == group) &&
+           (!subGroup.has_value() || channel.subGroup == subGroup);
+  }
+};
+
+// The channels of a group that there were when it was looked for, by their full names. Immutable
+// but for where they are in the sources' readings, which is found anew when a source's channels
+// change.
+class GroupChannels final : public IOReportChannels {
+ public:
+  GroupChannels(GroupName group, const Readings& readings)
+      : group_(std::move(group)), found_(readings.size()) {
+    for (const auto& reading : readings) {
+      if (reading == nullptr) continue;
+      for (std::size_t position = 0; position < reading->channels->size(); ++position) {
+        const ChannelDescription& channel = *(*reading->channels)[position];
+        if (group_.has(channel)) names_.insert(channel.fullName());
+      }
+    }
+  }
+
+  [[nodiscard]] std::int32_t count() const { return static_cast<std::int32_t>(names_.size()); }
+
+  // The part of a source's reading that is in the set.
+  [[nodiscard]] DriverSamples::Part select(std::size_t source,
+                                           std::shared_ptr<const Reading> reading) const {
     const MutexLock lock(mutex_);
     Found& found = found_[source];
     if (found.channels != reading->channels) {
       found = {reading->channels, find(*reading->channels)};
     }
-    return {std::move(reading), found.selection, source};
+    return {std::move(reading), found.selection};
   }
 
  private:
@@ -31,55 +73,42 @@ class GroupSelection {
     std::shared_ptr<const ChannelSelection> selection{};
   };
 
-  [[nodiscard]] bool has(const ChannelDescription& channel) const {
-    return (!group_.has_value() || channel.group == group_) &&
-           (!subGroup_.has_value() || channel.subGroup == subGroup_);
-  }
   [[nodiscard]] std::shared_ptr<const ChannelSelection> find(const ChannelList& channels) const {
     auto selection = std::make_shared<ChannelSelection>();
     for (std::uint32_t position = 0; position < channels.size(); ++position) {
-      if (has(*channels[position])) selection->push_back(position);
+      const ChannelDescription& channel = *channels[position];
+      // The group first: it needs no text to be made.
+      if (group_.has(channel) && names_.contains(channel.fullName())) {
+        selection->push_back(position);
+      }
     }
     return selection;
   }
 
-  const std::optional<std::string> group_;
-  const std::optional<std::string> subGroup_;
-  Mutex mutex_;
-  std::vector<Found> found_ HALVOX_GUARDED_BY(mutex_);  // by source
-};
-
-// The set of a group's channels is the group, with how many there were when it was asked for.
-class GroupChannels final : public IOReportChannels {
- public:
-  GroupChannels(std::shared_ptr<GroupSelection> groupSelection, std::int32_t channelCount)
-      : selection(std::move(groupSelection)), count(channelCount) {}
-  const std::shared_ptr<GroupSelection> selection;
-  const std::int32_t count;
+  const GroupName group_;
+  std::unordered_set<std::string> names_;
+  mutable Mutex mutex_;
+  mutable std::vector<Found> found_ HALVOX_GUARDED_BY(mutex_);  // by source
 };
 
 class GroupSubscription final : public IOReportSubscription {};
 
-std::shared_ptr<const DriverSamples> sample(
-    const std::vector<std::unique_ptr<SourceReader>>& readers,
-    std::chrono::milliseconds longestWait, GroupSelection& group) {
-  std::vector<SourceReader::Asked> asked;
-  asked.reserve(readers.size());
-  for (const auto& reader : readers) asked.push_back(reader->ask());
-  const auto deadline = SourceReader::Clock::now() + longestWait;
-  std::vector<DriverSamples::Part> parts;
-  DriverSamples::Sources late;
-  for (std::size_t source = 0; source < readers.size(); ++source) {
-    auto reading = readers[source]->take(std::move(asked[source]), deadline);
-    if (reading == nullptr) {
-      late.push_back(source);
-      continue;
-    }
-    DriverSamples::Part part = group.select(source, std::move(reading));
-    if (!part.selection->empty()) parts.push_back(std::move(part));
+// Reads when it is first asked.
+class ReadMoment final : public IOReportMoment {
+ public:
+  ReadMoment(const Readers& readers, std::chrono::milliseconds longestWait)
+      : readers_(readers), longestWait_(longestWait) {}
+
+  [[nodiscard]] const Readings& readings() {
+    if (!readings_.has_value()) readings_ = read(readers_, longestWait_);
+    return *readings_;
   }
-  return std::make_shared<DriverSamples>(std::move(parts), std::move(late));
-}
+
+ private:
+  const Readers& readers_;  // of the service
+  const std::chrono::milliseconds longestWait_;
+  std::optional<Readings> readings_;
+};
 
 const DriverSamples& samplesOf(const IOReportService::Samples& samples) {
   return static_cast<const DriverSamples&>(*samples);
@@ -105,15 +134,14 @@ void LinuxIOReportService::open() {
 
 IOReportService::Channels LinuxIOReportService::IOReportCopyChannelsInGroup(
     Name group, Name subGroup, std::optional<IOReportError>& /*error*/) {
-  auto selection = std::make_shared<GroupSelection>(group, subGroup, readers_.size());
-  std::size_t count = 0;
-  const auto samples = sample(readers_, longestWait_, *selection);
-  for (const auto& part : samples->parts()) count += part.selection->size();
-  return std::make_shared<GroupChannels>(std::move(selection), static_cast<std::int32_t>(count));
+  // What is missed here is missed for good, so it may take longer than a moment's samples.
+  const Readings readings = read(readers_, std::max(longestWait_, SourceReader::kLongestOpening));
+  GroupName names{std::optional<std::string>(group), std::optional<std::string>(subGroup)};
+  return std::make_shared<GroupChannels>(std::move(names), readings);
 }
 
 std::int32_t LinuxIOReportService::IOReportGetChannelCount(const Channels& channels) const {
-  return static_cast<const GroupChannels&>(*channels).count;
+  return static_cast<const GroupChannels&>(*channels).count();
 }
 
 IOReportService::Subscription LinuxIOReportService::IOReportCreateSubscription(
@@ -123,10 +151,22 @@ IOReportService::Subscription LinuxIOReportService::IOReportCreateSubscription(
   return std::make_shared<GroupSubscription>();
 }
 
+IOReportService::Moment LinuxIOReportService::makeMoment() {
+  return std::make_unique<ReadMoment>(readers_, longestWait_);
+}
+
 IOReportService::Samples LinuxIOReportService::IOReportCreateSamples(
-    const Subscription& /*subscription*/, const Channels& channels,
+    const Subscription& /*subscription*/, const Channels& channels, IOReportMoment& moment,
     std::optional<IOReportError>& /*error*/) {
-  return sample(readers_, longestWait_, *static_cast<const GroupChannels&>(*channels).selection);
+  const auto& group = static_cast<const GroupChannels&>(*channels);
+  const Readings& readings = static_cast<ReadMoment&>(moment).readings();
+  std::vector<DriverSamples::Part> parts;
+  for (std::size_t source = 0; source < readings.size(); ++source) {
+    if (readings[source] == nullptr) continue;
+    DriverSamples::Part part = group.select(source, readings[source]);
+    if (!part.selection->empty()) parts.push_back(std::move(part));
+  }
+  return std::make_shared<DriverSamples>(std::move(parts));
 }
 
 IOReportService::Samples LinuxIOReportService::IOReportCreateSamplesDelta(

@@ -11,12 +11,16 @@
 
 namespace halvox::platform::linux_ {
 
-// What the kernel, the sound server and other daemons count, as driver channels. A subscription is
-// to a group, not to the channels that are there when it is made: channels that appear later count
-// from zero. No reading holds the caller longer than the longest wait, all sources together; what
-// is late is left out.
+// What the kernel, the sound server and other daemons count, as driver channels. A set of channels
+// is of those that there are when it is asked for; a subscription never gets more. A channel that
+// goes and comes again is sampled again, known by its names and its format. A source that takes
+// longer than `SourceReader::kLongestOpening` to open is in no set that is asked for before it is
+// open.
 //
-// Any thread may call. Owns the sources and their threads, which sleep while nobody asks.
+// No moment holds the caller longer than the longest wait, all sources together; what is late is
+// left out of its samples. Looking for channels, which is done at the start only, may take as long
+// as the opening. Any thread may call. Owns the sources and their threads, which sleep while nobody
+// asks.
 class LinuxIOReportService final : public IOReportService {
  public:
   LinuxIOReportService(std::vector<std::unique_ptr<DriverSource>> sources,
@@ -33,7 +37,10 @@ class LinuxIOReportService final : public IOReportService {
   [[nodiscard]] std::int32_t IOReportGetChannelCount(const Channels& channels) const override;
   Subscription IOReportCreateSubscription(const Channels& channels, Channels& subscribedChannels,
                                           std::optional<IOReportError>& error) override;
+  [[nodiscard]] Moment makeMoment() override;
+  // The moment must be one of this service.
   Samples IOReportCreateSamples(const Subscription& subscription, const Channels& channels,
+                                IOReportMoment& moment,
                                 std::optional<IOReportError>& error) override;
   Samples IOReportCreateSamplesDelta(const Samples& previous, const Samples& current,
                                      std::optional<IOReportError>& error) override;

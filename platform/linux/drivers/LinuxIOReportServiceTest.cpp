@@ -2,6 +2,7 @@
 
 #include <array>
 #include <condition_variable>
+#include <limits>
 #include <mutex>
 #include <thread>
 
@@ -58,7 +59,7 @@ class LinuxIOReportServiceTest : public ::testing::Test {
 
   IOReportService::Samples sample(const IOReportService::Channels& channels) {
     std::optional<IOReportError> error;
-    return service_->IOReportCreateSamples(nullptr, channels, error);
+    return service_->IOReportCreateSamples(nullptr, channels, *service_->makeMoment(), error);
   }
 
   IOReportService::Channels find(IOReportService::Name group, IOReportService::Name subGroup) {
@@ -102,59 +103,87 @@ TEST_F(LinuxIOReportServiceTest, AGroupIsChosenByItsNamesAndAnAbsentNameMeansAny
   EXPECT_EQ(service.IOReportGetChannelCount(find("Tx", std::nullopt)), 0);
 }
 
-TEST_F(LinuxIOReportServiceTest, AChannelThatComesAfterTheSubscriptionIsSampledToo) {
-  std::vector channels{simpleChannel("Tx", "a")};
-  serve([&] { return makeReading(channels, std::vector<std::uint64_t>(channels.size(), 1)); });
-  const auto found = find("Tx", std::nullopt);
-  std::this_thread::sleep_for(2 * SourceReader::kMoment);  // no reading of before is shared
-
-  channels.push_back(simpleChannel("Tx", "b"));
-
-  EXPECT_THAT(show(sample(found)), ElementsAre("-/Tx/-/a  = 1", "-/Tx/-/b  = 1"));
-}
-
-TEST_F(LinuxIOReportServiceTest, SamplesOfOneMomentShareOneReading) {
-  std::atomic<int> readings{0};
-  const auto channel = simpleChannel("Tx", "a");
-  serve([&] {
-    ++readings;
-    return makeReading({channel}, {1});
-  });
-  const auto found = find("Tx", std::nullopt);
-  std::this_thread::sleep_for(2 * SourceReader::kMoment);
-  readings = 0;
-
-  const auto start = Clock::now();
-  const auto first = sample(found);
-  const auto second = sample(found);
-  const bool isOneMoment = Clock::now() - start < SourceReader::kMoment;
-
-  EXPECT_EQ(readings, isOneMoment ? 1 : readings.load());
-  EXPECT_LE(readings, 2);
-}
-
 // As in a report, which lets go of each group's samples before it takes the next one's.
-TEST_F(LinuxIOReportServiceTest, GroupsThatAreSampledOneAfterTheOtherShareOneReading) {
+TEST_F(LinuxIOReportServiceTest, AllGroupsOfAMomentShareOneReading) {
   std::atomic<int> readings{0};
   const std::vector channels{simpleChannel("Tx", "a"), simpleChannel("Rx", "b")};
-  serve([&] {
+  auto& service = serve([&] {
     ++readings;
     return makeReading(channels, {1, 2});
   });
   const std::array groups{find("Tx", std::nullopt), find("Rx", std::nullopt)};
+  readings = 0;
+  const auto moment = service.makeMoment();
+  std::optional<IOReportError> error;
 
-  bool isOneMoment = false;
-  // A busy machine may stop for longer than a moment in between.
-  for (int attempt = 0; attempt < 100 && !isOneMoment; ++attempt) {
-    std::this_thread::sleep_for(2 * SourceReader::kMoment);
-    readings = 0;
-    const auto start = Clock::now();
-    for (const auto& group : groups) EXPECT_THAT(show(sample(group)), SizeIs(1));
-    isOneMoment = Clock::now() - start < SourceReader::kMoment;
+  for (const auto& group : groups) {
+    EXPECT_THAT(show(service.IOReportCreateSamples(nullptr, group, *moment, error)), SizeIs(1));
   }
 
-  EXPECT_TRUE(isOneMoment);
   EXPECT_EQ(readings, 1);
+}
+
+// Readings that a test lets end one by one, each of its own number.
+class SteppedReadings {
+ public:
+  std::shared_ptr<const Reading> make() {
+    std::unique_lock lock(mutex_);
+    const std::uint64_t number = ++begun_;
+    changed_.notify_all();
+    changed_.wait(lock, [&] { return allowed_ >= number; });
+    return makeReading({channel_}, {number});
+  }
+  void allow(std::uint64_t number) {
+    const std::lock_guard lock(mutex_);
+    allowed_ = number;
+    changed_.notify_all();
+  }
+  void waitUntilBegun(std::uint64_t number) {
+    std::unique_lock lock(mutex_);
+    changed_.wait(lock, [&] { return begun_ >= number; });
+  }
+  std::uint64_t begun() {
+    const std::lock_guard lock(mutex_);
+    return begun_;
+  }
+
+ private:
+  std::mutex mutex_;
+  std::condition_variable changed_;
+  const ChannelList::Channel channel_ = simpleChannel("Tx", "number");
+  std::uint64_t begun_ = 0;
+  std::uint64_t allowed_ = std::numeric_limits<std::uint64_t>::max();
+};
+
+TEST_F(LinuxIOReportServiceTest, AReadingThatWasBegunBeforeIsNotUsedAndTheNextOneIsShared) {
+  constexpr std::uint64_t kAskers = 8;
+  SteppedReadings readings;
+  serve([&readings] { return readings.make(); });
+  const auto found = find("Tx", std::nullopt);
+  const std::uint64_t before = readings.begun();
+  readings.allow(before);
+  std::vector<std::string> first;
+  std::jthread asker([&] { first = show(sample(found)); });
+  readings.waitUntilBegun(before + 1);
+
+  // They ask while that reading is being made, and wait for the next one.
+  const auto asked = [this] {
+    return platform_.statistics.values("driver source made").at("readings asked for");
+  };
+  const auto askedBefore = asked();
+  std::vector<std::vector<std::string>> others(kAskers);
+  std::vector<std::jthread> threads;
+  for (auto& lines : others) threads.emplace_back([&] { lines = show(sample(found)); });
+  while (asked() < askedBefore + kAskers) std::this_thread::yield();
+  readings.allow(std::numeric_limits<std::uint64_t>::max());
+  asker.join();
+  threads.clear();
+
+  EXPECT_THAT(first, ElementsAre("-/Tx/-/number  = " + std::to_string(before + 1)));
+  for (const auto& lines : others) {
+    EXPECT_THAT(lines, ElementsAre("-/Tx/-/number  = " + std::to_string(before + 2)));
+  }
+  EXPECT_EQ(readings.begun(), before + 2);
 }
 
 TEST_F(LinuxIOReportServiceTest, ASlowSourceIsLeftOutAndTheOthersAreNot) {
@@ -168,7 +197,6 @@ TEST_F(LinuxIOReportServiceTest, ASlowSourceIsLeftOutAndTheOthersAreNot) {
       },
       [fast] { return makeReading({fast}, {2}); });
   const auto found = find("Tx", std::nullopt);
-  std::this_thread::sleep_for(2 * SourceReader::kMoment);
 
   gate_.close();
   const auto samples = sample(found);
@@ -184,7 +212,6 @@ TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndTheLogTellsItO
     return makeReading({simpleChannel("Tx", "a")}, {1});
   });
   const auto found = find("Tx", std::nullopt);
-  std::this_thread::sleep_for(2 * SourceReader::kMoment);
   gate_.close();
   (void)sample(found);
 
@@ -206,7 +233,6 @@ TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
     return makeReading({simpleChannel("Tx", "a")}, {1});
   });
   const auto found = find("Tx", std::nullopt);
-  std::this_thread::sleep_for(2 * SourceReader::kMoment);
   gate_.close();
   (void)sample(found);
   gate_.open();
@@ -226,7 +252,6 @@ TEST_F(LinuxIOReportServiceTest, WhatASourceThatWasLateAtTheSnapshotCountedIsNot
     return makeReading({channel}, {1000});
   });
   const auto found = find("Tx", std::nullopt);
-  std::this_thread::sleep_for(2 * SourceReader::kMoment);
   gate_.close();
   const auto snapshot = sample(found);
   gate_.open();
@@ -252,7 +277,6 @@ TEST_F(LinuxIOReportServiceTest, SourcesAreReadAtOnce) {
   const auto b = simpleChannel("Tx", "b");
   serve([&] { return meet(a); }, [&] { return meet(b); });
   const auto found = find("Tx", std::nullopt);
-  std::this_thread::sleep_for(2 * SourceReader::kMoment);
   entered = 0;
   isOver = false;
 
@@ -297,7 +321,6 @@ TEST_F(LinuxIOReportServiceTest, ReadingsAskedForAreGivenOrLate) {
   });
   const auto found = find("Tx", std::nullopt);
   gate_.close();
-  std::this_thread::sleep_for(2 * SourceReader::kMoment);
   (void)sample(found);
   gate_.open();
 

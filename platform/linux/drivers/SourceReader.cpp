@@ -36,98 +36,93 @@ SourceReader::~SourceReader() {
 
 void SourceReader::startOpening() {
   thread_ = std::thread([this] { run(); });
-  const MutexLock lock(mutex_);
-  opening_ = want();
+  opening_ = ask(kLongestOpening);
 }
 
 void SourceReader::waitUntilOpen() {
-  const MutexLock lock(mutex_);
-  (void)waitFor(opening_, Clock::now() + kLongestOpening);
-}
-
-SourceReader::Asked SourceReader::ask() {
-  received_.add();
-  const MutexLock lock(mutex_);
-  if (newest_ != nullptr && Clock::now() - newestTime_ < kMoment) return {.reading = newest_};
-  // A source that is late is read all the same, to see whether it has come round.
-  if (isLate_) {
-    if (!std::exchange(isWanted_, true)) wanted_.notifyAll();
-    return {};
-  }
-  return {.reading = nullptr, .number = want(), .isWaiting = true};
-}
-
-std::shared_ptr<const Reading> SourceReader::take(Asked asked, Clock::time_point deadline) {
-  ReadingPointer reading = std::move(asked.reading);
   bool isFirstLate = false;
-  if (asked.isWaiting) {
-    const MutexLock lock(mutex_);
-    reading = waitFor(asked.number, deadline);
-    isFirstLate = reading == nullptr && !std::exchange(isLate_, true);
-  }
-  (reading == nullptr ? late_ : given_).add();
+  if (receive(opening_, isFirstLate) != nullptr) return;
+  kLog.error("the driver counters of ", source_->name(), " did not come within ",
+             opening_.wait.count(), " ms; they are left out until the service starts again");
+}
+
+SourceReader::Asked SourceReader::ask(std::chrono::milliseconds wait) {
+  const MutexLock lock(mutex_);
+  const std::uint64_t number = want();
+  received_.add();
+  // A source that is late is read all the same, to see whether it has come round.
+  if (isLate_) return {};
+  ++waiting_;
+  return {.number = number, .isWaiting = true, .wait = wait, .deadline = Clock::now() + wait};
+}
+
+std::shared_ptr<const Reading> SourceReader::take(const Asked& asked) {
+  bool isFirstLate = false;
+  ReadingPointer reading = receive(asked, isFirstLate);
   if (isFirstLate) {
     kLog.error("the driver counters of ", source_->name(), " did not come within ",
-               longestWait_.count(), " ms and are left out until they do");
+               asked.wait.count(), " ms and are left out until they do");
   }
   return reading;
 }
 
-// Has a reading made, unless one is being made, and promises to wait for it; returns how many there
-// were before it.
+SourceReader::ReadingPointer SourceReader::receive(const Asked& asked, bool& isFirstLate) {
+  ReadingPointer reading;
+  if (asked.isWaiting) {
+    const MutexLock lock(mutex_);
+    reading = waitFor(asked.number, asked.deadline);
+    isFirstLate = reading == nullptr && !std::exchange(isLate_, true);
+  }
+  (reading == nullptr ? late_ : given_).add();
+  return reading;
+}
+
+// Has a reading made that is begun after this; returns its number.
 std::uint64_t SourceReader::want() {
-  if (!std::exchange(isWanted_, true)) wanted_.notifyAll();
-  ++waiting_;
-  return numberMade_;
+  const std::uint64_t number = lastBegun_ + 1;
+  if (lastWanted_ < number) {
+    lastWanted_ = number;
+    wanted_.notifyAll();
+  }
+  return number;
 }
 
 // Null when it is late.
 SourceReader::ReadingPointer SourceReader::waitFor(std::uint64_t number,
                                                    Clock::time_point deadline) {
   bool inTime = true;
-  while (numberMade_ == number && inTime) inTime = made_.waitUntil(mutex_, deadline);
-  ReadingPointer reading = numberMade_ == number ? nullptr : handedOver_;
+  while (lastMade_ < number && inTime) inTime = made_.waitUntil(mutex_, deadline);
+  ReadingPointer reading = lastMade_ < number ? nullptr : handedOver_;
   if (--waiting_ == 0) handedOver_.reset();
   return reading;
 }
 
-// Lets go of the newest reading when its moment is over.
-void SourceReader::waitUntilWanted() {
-  while (!isWanted_ && !isEnding_) {
-    if (newest_ == nullptr) {
-      wanted_.wait(mutex_);
-    } else if (!wanted_.waitUntil(mutex_, newestTime_ + kMoment)) {
-      ReadingPointer old = std::exchange(newest_, nullptr);
-      mutex_.unlock();
-      // What the source does when nobody holds its reading any more must hold up no asker.
-      old.reset();
-      mutex_.lock();
-    }
-  }
-}
-
 void SourceReader::run() {
   source_->open();
-  mutex_.lock();
+  const MutexLock lock(mutex_);
+  makeReadings();
+}
+
+void SourceReader::makeReadings() {
   while (true) {
-    waitUntilWanted();
-    if (isEnding_) break;
-    ReadingPointer old = std::exchange(newest_, nullptr);
+    while (lastWanted_ == lastBegun_ && !isEnding_) wanted_.wait(mutex_);
+    if (isEnding_) return;
+    ++lastBegun_;
     mutex_.unlock();
-    old.reset();
     const Clock::time_point start = Clock::now();
     ReadingPointer reading = source_->read();
-    const Clock::time_point now = Clock::now();
+    const Clock::duration time = Clock::now() - start;
     mutex_.lock();
-    if (now - start <= longestWait_) isLate_ = false;
-    isWanted_ = false;
-    ++numberMade_;
-    newestTime_ = now;
-    if (waiting_ > 0) handedOver_ = reading;
-    newest_ = std::move(reading);
+    if (time <= longestWait_) isLate_ = false;
+    lastMade_ = lastBegun_;
+    // Also when they wait for the next one, which takes its place.
+    if (waiting_ > 0) std::swap(handedOver_, reading);
     made_.notifyAll();
+    mutex_.unlock();
+    // What the source does when nobody holds its reading any more must hold up no asker.
+    reading.reset();
+    mutex_.lock();
   }
-  mutex_.unlock();
 }
 
 }  // namespace halvox::platform::linux_

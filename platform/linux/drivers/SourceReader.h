@@ -12,15 +12,13 @@
 namespace halvox::platform::linux_ {
 
 // Reads one source on a thread of its own, so that whoever asks waits no longer than a bound.
-// Readings are shared: whoever asks within the same moment gets the same one, so the groups of a
-// snapshot or report are of one moment. Any thread may ask. Owns the source. Its end waits for a
-// reading that is being made.
+// Nobody is given a reading that was begun before he asked; those who ask while a reading is made
+// share the next one. Any thread may ask. Owns the source. Its end waits for a reading that is
+// being made.
 class SourceReader {
  public:
   using Clock = std::chrono::steady_clock;
 
-  // Readings that are asked for within this time are the same.
-  static constexpr std::chrono::milliseconds kMoment{5};
   static constexpr std::chrono::milliseconds kLongestWait{50};
   static constexpr std::chrono::milliseconds kLongestOpening{1000};
 
@@ -31,29 +29,33 @@ class SourceReader {
   SourceReader& operator=(const SourceReader&) = delete;
   ~SourceReader();
 
-  // Begins to open the source; then waits until it has, or has taken too long. Once each, in this
-  // order. Before it, every reading is late.
+  // Begins to open the source; then waits until it has, or has taken too long, which is logged and
+  // makes it late. Once each, in this order, before all else.
   void startOpening();
   void waitUntilOpen();
-  // What somebody asked for; to be taken by him, once.
+  // What somebody asked for. Taken once, by the one who asked.
   struct Asked {
-    std::shared_ptr<const Reading> reading{};  // there already
-    std::uint64_t number = 0;
+    std::uint64_t number = 0;  // of the first reading that is new enough
     bool isWaiting = false;
+    std::chrono::milliseconds wait{};
+    Clock::time_point deadline{};
   };
-  // Has the source begin with the reading of this moment, so that several can be at it at once.
-  [[nodiscard]] Asked ask();
+  // Has the source begin with a reading, which may take so long; several sources can be at it at
+  // once.
+  [[nodiscard]] Asked ask(std::chrono::milliseconds wait);
   // The reading that was asked for; null, with a line in the log once in a row, when it does not
-  // come before the deadline. A source that was late once is read, but nobody waits for it before a
-  // reading of it took no longer than allowed.
-  [[nodiscard]] std::shared_ptr<const Reading> take(Asked asked, Clock::time_point deadline);
+  // come in time. A source that was late once is read, but nobody waits for it before a reading of
+  // it took no longer than allowed.
+  [[nodiscard]] std::shared_ptr<const Reading> take(const Asked& asked);
 
  private:
   using ReadingPointer = std::shared_ptr<const Reading>;
 
+  // Null when it is late; sets whether it was not late before.
+  [[nodiscard]] ReadingPointer receive(const Asked& asked, bool& isFirstLate);
   void run();
-  void waitUntilWanted() HALVOX_REQUIRES(mutex_);
-  [[nodiscard]] std::uint64_t want() HALVOX_REQUIRES(mutex_);
+  void makeReadings() HALVOX_REQUIRES(mutex_);
+  std::uint64_t want() HALVOX_REQUIRES(mutex_);
   [[nodiscard]] ReadingPointer waitFor(std::uint64_t number, Clock::time_point deadline)
       HALVOX_REQUIRES(mutex_);
 
@@ -62,19 +64,19 @@ class SourceReader {
   Counter& received_;
   Counter& given_;
   Counter& late_;
-  std::uint64_t opening_ = 0;  // of the thread that opens
+  Asked opening_{};  // of the thread that opens
   Mutex mutex_;
   Condition wanted_;
   Condition made_;
-  bool isWanted_ HALVOX_GUARDED_BY(mutex_) = false;
   bool isEnding_ HALVOX_GUARDED_BY(mutex_) = false;
-  bool isLate_ HALVOX_GUARDED_BY(mutex_) = false;  // told, and not come round yet
-  std::uint64_t numberMade_ HALVOX_GUARDED_BY(mutex_) = 0;
+  bool isLate_ HALVOX_GUARDED_BY(mutex_) = false;  // logged, and not come round yet
+  // Readings are numbered from 1 on: the last that somebody wants, that was begun, that was made.
+  std::uint64_t lastWanted_ HALVOX_GUARDED_BY(mutex_) = 0;
+  std::uint64_t lastBegun_ HALVOX_GUARDED_BY(mutex_) = 0;
+  std::uint64_t lastMade_ HALVOX_GUARDED_BY(mutex_) = 0;
   int waiting_ HALVOX_GUARDED_BY(mutex_) = 0;
-  // Each held only as long as it is of use: a source looks at who holds its readings.
-  ReadingPointer handedOver_ HALVOX_GUARDED_BY(mutex_);  // while somebody waits for it
-  ReadingPointer newest_ HALVOX_GUARDED_BY(mutex_);      // for its moment
-  Clock::time_point newestTime_ HALVOX_GUARDED_BY(mutex_){};
+  // The last made, held only while somebody waits: a source looks at who holds its readings.
+  ReadingPointer handedOver_ HALVOX_GUARDED_BY(mutex_);
   std::thread thread_;
 };
 

@@ -144,6 +144,7 @@ void AlsaSource::readSubstream(int pcmDirectory, const std::string& path, const 
                        std::span<const std::uint64_t> values) {
     ChannelDescription channel = pcm;
     channel.format = format;
+    channel.kind = IOReportKind::kCounter;
     channel.channelName = name + suffix;
     channel.unitLabel = unit;
     if (format == IOReportFormat::kState) channel.states = pcmStates();

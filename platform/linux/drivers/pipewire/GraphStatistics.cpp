@@ -42,26 +42,47 @@ GraphStatistics::GraphStatistics()
           makeChannel(describePipewireChannel(kSinkGroup, "pipewire", "connections")),
           makeChannel(describePipewireChannel(kSourceGroup, "pipewire", "connections"))} {}
 
-void GraphStatistics::serverLost() {
+void GraphStatistics::serverLost(Time now) {
+  for (auto& [id, node] : nodes_) keep(std::move(node), now);
   nodes_.clear();
   drivers_.clear();
 }
 
-void GraphStatistics::profilingBegan() {
-  drivers_.clear();
-  for (auto& [id, node] : nodes_) node->restartExtremes();
-}
+void GraphStatistics::profilingBegan() { drivers_.clear(); }
 
 bool GraphStatistics::nodeAdded(NodeID id, std::string_view mediaClass, std::string_view name) {
   const std::string_view group = groupOf(mediaClass);
   if (group.empty() || nodes_.size() >= kMostNodes) return false;
-  nodes_[id] = std::make_unique<NodeStatistics>(std::string(group), nameFor(id, group, name));
+  nodes_[id] = statisticsOf(group, nameFor(id, group, name));
   return true;
 }
 
-void GraphStatistics::nodeRemoved(NodeID id) {
-  nodes_.erase(id);
+void GraphStatistics::nodeRemoved(NodeID id, Time now) {
+  if (const auto found = nodes_.find(id); found != nodes_.end()) {
+    keep(std::move(found->second), now);
+    nodes_.erase(found);
+  }
   drivers_.erase(id);
+}
+
+void GraphStatistics::keep(std::unique_ptr<NodeStatistics> node, Time now) {
+  node->left(now);
+  if (gone_.size() == kMostNodes) gone_.pop_front();
+  gone_.push_back(std::move(node));
+}
+
+// Those of the node of that name that went before, else new ones.
+std::unique_ptr<NodeStatistics> GraphStatistics::statisticsOf(std::string_view group,
+                                                              const std::string& name) {
+  const auto found = std::ranges::find_if(gone_, [&](const auto& node) {
+    return node->group() == group && node->driverName() == name;
+  });
+  if (found == gone_.end()) {
+    return std::make_unique<NodeStatistics>(std::string(group), name);
+  }
+  auto node = std::move(*found);
+  gone_.erase(found);
+  return node;
 }
 
 void GraphStatistics::nodeStateChanged(NodeID id, std::optional<NodeState> state, Time now) {

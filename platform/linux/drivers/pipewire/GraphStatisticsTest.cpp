@@ -50,7 +50,7 @@ TEST_F(GraphStatisticsTest, OnlyTheConnectionsAreThereWithoutAServer) {
                                   "pipewire/Rx/PipeWire/connections  = 0"));
 
   graph.serverReached();
-  graph.serverLost();
+  graph.serverLost(now);
   graph.serverReached();
 
   EXPECT_THAT(read(), ElementsAre("pipewire/Speaker/PipeWire/connections  = 2",
@@ -82,10 +82,10 @@ TEST_F(GraphStatisticsTest, ACycleCountsForItsDriverAndForEachFollower) {
   EXPECT_THAT(read("speakers"), Contains(EndsWith("/cycles  = 2")));
   EXPECT_THAT(read("speakers/Speaker/PipeWire/busy"),
               ElementsAre(::testing::HasSubstr(" 200-500:2 ")));
-  EXPECT_THAT(read("speakers/Speaker/PipeWire/busy"), ElementsAre(EndsWith("min 300 max 300")));
-  EXPECT_THAT(read("speakers/Speaker/PipeWire/wait"), ElementsAre(EndsWith("min 60 max 60")));
+  EXPECT_THAT(read("speakers/Speaker/PipeWire/busy"), ElementsAre(EndsWith("min 200 max 500")));
+  EXPECT_THAT(read("speakers/Speaker/PipeWire/wait"), ElementsAre(EndsWith("min 50 max 100")));
   EXPECT_THAT(read("microphone"), Contains(EndsWith("/cycles  = 2")));
-  EXPECT_THAT(read("microphone/Rx/PipeWire/wait"), ElementsAre(EndsWith("min 10 max 10")));
+  EXPECT_THAT(read("microphone/Rx/PipeWire/wait"), ElementsAre(EndsWith("min 0 max 50")));
 }
 
 TEST_F(GraphStatisticsTest, ACycleThatIsToldTwiceCountsOnceWithItsXruns) {
@@ -187,21 +187,68 @@ TEST_F(GraphStatisticsTest, TwoNodesOfOneNameCountApart) {
   EXPECT_THAT(read("twin#40/"), Contains(EndsWith("/cycles  = 0")));
 }
 
-TEST_F(GraphStatisticsTest, ANodeThatGoesTakesItsChannelsAndItsSuccessorCountsFromZero) {
+TEST_F(GraphStatisticsTest, ANodeThatGoesTakesItsChannelsAndItsSuccessorCountsOnWithThem) {
   graph.nodeAdded(30, "Audio/Sink", "speakers");
   graph.cycleEnded(cycle(1s));
-  graph.nodeRemoved(30);
+  graph.addTo(maker, now);
+  const auto before = maker.finish();
+  graph.nodeRemoved(30, now);
   EXPECT_THAT(read("speakers"), IsEmpty());
 
-  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.nodeAdded(31, "Audio/Sink", "speakers");
+  EXPECT_THAT(read("speakers"), Contains(EndsWith("/cycles  = 1")));
 
-  EXPECT_THAT(read("speakers"), Contains(EndsWith("/cycles  = 0")));
+  graph.addTo(maker, now);
+  const auto after = maker.finish();
+  ASSERT_EQ(after->channels->size(), before->channels->size());
+  for (std::size_t channel = 0; channel < before->channels->size(); ++channel) {
+    EXPECT_EQ((*after->channels)[channel], (*before->channels)[channel]);
+  }
+}
+
+TEST_F(GraphStatisticsTest, ANodeOfAnotherGroupIsNoSuccessor) {
+  graph.nodeAdded(30, "Audio/Sink", "both");
+  graph.cycleEnded(cycle(1s));
+  graph.nodeRemoved(30, now);
+
+  graph.nodeAdded(31, "Audio/Source", "both");
+
+  EXPECT_THAT(read("both"), Contains(EndsWith("/cycles  = 0")));
+}
+
+TEST_F(GraphStatisticsTest, ANodeThatIsGoneIsInNoState) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.nodeStateChanged(30, NodeState::kIdle, now);
+  now += 2s;
+  graph.serverLost(now);
+  now += 7s;
+
+  graph.nodeAdded(31, "Audio/Sink", "speakers");
+  graph.nodeStateChanged(31, NodeState::kIdle, now);
+  now += 3s;
+
+  EXPECT_THAT(read("speakers/Speaker/PipeWire/state"),
+              ElementsAre("speakers/Speaker/PipeWire/state us = idle:0:5000000"));
+}
+
+TEST_F(GraphStatisticsTest, OfNodesThatAreGoneTheMostIsKept) {
+  for (std::uint32_t id = 0; id <= GraphStatistics::kMostNodes; ++id) {
+    ASSERT_TRUE(graph.nodeAdded(id, "Audio/Sink", "node" + std::to_string(id)));
+    graph.cycleEnded({.time = 1s, .length = 10ms, .driver = ProfiledNode{.id = id}});
+    graph.nodeRemoved(id, now);
+  }
+
+  graph.nodeAdded(1000, "Audio/Sink", "node0");
+  graph.nodeAdded(1001, "Audio/Sink", "node1");
+
+  EXPECT_THAT(read("node0"), Contains(EndsWith("/cycles  = 0")));
+  EXPECT_THAT(read("node1/"), Contains(EndsWith("/cycles  = 1")));
 }
 
 TEST_F(GraphStatisticsTest, AllNodesGoWithTheServer) {
   graph.nodeAdded(30, "Audio/Sink", "speakers");
 
-  graph.serverLost();
+  graph.serverLost(now);
 
   EXPECT_THAT(read("speakers"), IsEmpty());
 }

@@ -1,7 +1,6 @@
 #include "platform/linux/drivers/pipewire/NodeStatistics.h"
 
 #include <algorithm>
-#include <limits>
 #include <span>
 #include <utility>
 
@@ -44,9 +43,8 @@ std::vector<BucketBounds> DurationHistogram::bounds() {
   std::vector<BucketBounds> bounds;
   for (std::size_t index = 0; index < kBuckets; ++index) {
     const bool isLast = index + 1 == kBuckets;
-    bounds.push_back(
-        {.lower = kLowerBounds[index],
-         .upper = isLast ? std::numeric_limits<std::int64_t>::max() : kLowerBounds[index + 1]});
+    bounds.push_back({.lower = kLowerBounds[index],
+                      .upper = isLast ? kIOReportNoUpperBound : kLowerBounds[index + 1]});
   }
   return bounds;
 }
@@ -56,21 +54,6 @@ void DurationHistogram::add(std::chrono::nanoseconds duration) {
       std::max<std::int64_t>(0, duration_cast<microseconds>(duration).count());
   const auto* const next = std::ranges::upper_bound(kLowerBounds, value);
   ++hits_[static_cast<std::size_t>(next - kLowerBounds.begin()) - 1];
-  minimum_ = std::min(minimum_.value_or(value), value);
-  maximum_ = std::max(maximum_.value_or(value), value);
-}
-
-void DurationHistogram::restartExtremes() {
-  minimum_.reset();
-  maximum_.reset();
-}
-
-std::array<std::uint64_t, DurationHistogram::kBuckets + 2> DurationHistogram::values() const {
-  std::array<std::uint64_t, kBuckets + 2> values{};
-  std::ranges::copy(hits_, values.begin());
-  values[kBuckets] = static_cast<std::uint64_t>(minimum_.value_or(0));
-  values[kBuckets + 1] = static_cast<std::uint64_t>(maximum_.value_or(0));
-  return values;
 }
 
 // In the order of NodeState.
@@ -83,6 +66,11 @@ void StateResidency::change(std::optional<NodeState> state, Time now) {
   state_ = state;
   since_ = now;
   isKnown_ = true;
+}
+
+void StateResidency::leave(Time now) {
+  change(std::nullopt, now);
+  isKnown_ = false;
 }
 
 std::array<std::uint64_t, 2 * StateResidency::kStates> StateResidency::values(Time now) const {
@@ -107,11 +95,6 @@ void NodeStatistics::cycleEnded(const pipewire::ProfiledNode& node) {
   ++cycles_;
   if (node.wait.has_value()) wait_.add(*node.wait);
   if (node.busy.has_value()) busy_.add(*node.busy);
-}
-
-void NodeStatistics::restartExtremes() {
-  busy_.restartExtremes();
-  wait_.restartExtremes();
 }
 
 void NodeStatistics::addTo(ReadingMaker& maker, Time now) const {

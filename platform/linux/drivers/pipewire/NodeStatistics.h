@@ -12,8 +12,8 @@
 
 namespace halvox::platform::linux_ {
 
-// How long the work of a node took, in microseconds: hits of fixed buckets, minimum and maximum.
-// The last bucket is open.
+// How long the work of a node took, in microseconds: hits of fixed buckets, of which the last is
+// open.
 class DurationHistogram {
  public:
   static constexpr std::size_t kBuckets = 11;
@@ -25,15 +25,11 @@ class DurationHistogram {
 
   // Negative durations count as none.
   void add(std::chrono::nanoseconds duration);
-  // Forgets minimum and maximum, for those who begin to measure now.
-  void restartExtremes();
   // The numbers of its channel.
-  [[nodiscard]] std::array<std::uint64_t, kBuckets + 2> values() const;
+  [[nodiscard]] const std::array<std::uint64_t, kBuckets>& values() const { return hits_; }
 
  private:
   std::array<std::uint64_t, kBuckets> hits_{};
-  std::optional<std::int64_t> minimum_;
-  std::optional<std::int64_t> maximum_;
 };
 
 enum class NodeState : std::uint8_t { kRunning, kIdle, kSuspended };
@@ -50,6 +46,8 @@ class StateResidency {
   // None: it is in no state that counts. The state it is in already is no transition, nor is the
   // first one that is known.
   void change(std::optional<NodeState> state, Time now);
+  // It is not there any more; the state in which it is when it comes again is the first one.
+  void leave(Time now);
   // The numbers of its channel: for each state transitions and microseconds, up to now.
   [[nodiscard]] std::array<std::uint64_t, 2 * kStates> values(Time now) const;
 
@@ -76,7 +74,8 @@ class NodeStatistics {
   void cycleEnded(const pipewire::ProfiledNode& node);
   void xrunsHappened(std::uint32_t count) { xruns_ += count; }
   void stateChanged(std::optional<NodeState> state, Time now) { states_.change(state, now); }
-  void restartExtremes();
+  // The node is gone. Its counts go on when one of its name comes.
+  void left(Time now) { states_.leave(now); }
   void addTo(ReadingMaker& maker, Time now) const;
   [[nodiscard]] const std::string& driverName() const { return *cyclesChannel_->driverName; }
   [[nodiscard]] const std::string& group() const { return *cyclesChannel_->group; }

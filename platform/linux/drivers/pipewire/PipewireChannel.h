@@ -13,10 +13,11 @@ inline constexpr const char* kSinkGroup = "Speaker";
 inline constexpr const char* kSourceGroup = "Rx";
 inline constexpr const char* kPipewireSubGroup = "PipeWire";
 
-// A simple channel of this source, to be made another one where that is meant.
+// A counter of this source, to be made a channel of another format where that is meant.
 inline ChannelDescription describePipewireChannel(std::string group, std::string driver,
                                                   std::string name) {
   ChannelDescription channel;
+  channel.kind = IOReportKind::kCounter;
   channel.group = std::move(group);
   channel.subGroup = kPipewireSubGroup;
   channel.driverName = std::move(driver);

@@ -194,7 +194,7 @@ void PipewireConnection::disconnect() {
   core_.reset();
   settle();
   const MutexLock lock(graph_.mutex);
-  graph_.statistics.serverLost();
+  graph_.statistics.serverLost(Clock::now());
 }
 
 void PipewireConnection::settle() {
@@ -305,7 +305,7 @@ void PipewireConnection::onGlobalRemove(void* data, std::uint32_t id) {
   }
   self->nodes_.erase(id);
   const MutexLock lock(self->graph_.mutex);
-  self->graph_.statistics.nodeRemoved(id);
+  self->graph_.statistics.nodeRemoved(id, Clock::now());
 }
 
 }  // namespace halvox::platform::linux_

@@ -1,7 +1,6 @@
 #include "platform/linux/drivers/textfile/MetricChannels.h"
 
 #include <algorithm>
-#include <limits>
 #include <map>
 #include <optional>
 #include <tuple>
@@ -133,9 +132,9 @@ class ChannelMaker {
   void addCounter(const MetricFamily& family) {
     for (const MetricSample& sample : family.samples) {
       if (isCreationTime(sample)) continue;
-      channels_.push_back({describe(family, sample.labels, IOReportFormat::kSimple),
-                           {countOf(sample)},
-                           sample.line});
+      ChannelDescription channel = describe(family, sample.labels, IOReportFormat::kSimple);
+      channel.kind = IOReportKind::kCounter;
+      channels_.push_back({std::move(channel), {countOf(sample)}, sample.line});
     }
   }
 
@@ -190,26 +189,13 @@ class BucketReader {
     total_ = hits;
   }
 
-  // The bounds go into the description, the hits with minimum and maximum into the values.
+  // The bounds go into the description, the hits into the values.
   std::vector<std::uint64_t> finish(std::size_t line, const MetricSample* count,
                                     ChannelDescription& description) {
     if (!isComplete_) refuse(line, "expected a bucket with le=\"+Inf\"");
     if (count != nullptr && countOf(*count) != total_) {
       refuse(count->line, "expected the count of the bucket with le=\"+Inf\"");
     }
-    const auto isHit = [](std::uint64_t hits) { return hits > 0; };
-    const auto lowest = std::ranges::find_if(values_, isHit);
-    std::int64_t minimum = 0;
-    std::int64_t maximum = 0;
-    for (auto hit = lowest; hit != values_.end();
-         hit = std::find_if(hit + 1, values_.end(), isHit)) {
-      maximum = buckets_[static_cast<std::size_t>(hit - values_.begin())].upper;
-    }
-    if (lowest != values_.end()) {
-      minimum = buckets_[static_cast<std::size_t>(lowest - values_.begin())].lower;
-    }
-    values_.push_back(static_cast<std::uint64_t>(minimum));
-    values_.push_back(static_cast<std::uint64_t>(maximum));
     description.buckets = std::move(buckets_);
     return std::move(values_);
   }
@@ -218,7 +204,7 @@ class BucketReader {
   std::int64_t bound(const MetricSample& sample) {
     const std::string& text = labelOf(sample, "le");
     isComplete_ = text == "+Inf";
-    if (isComplete_) return std::numeric_limits<std::int64_t>::max();
+    if (isComplete_) return kIOReportNoUpperBound;
     const auto number = MetricNumber::parse(text);
     const auto whole = number.has_value() ? number->cutDown() : std::nullopt;
     if (!whole.has_value() || *whole < 0 || static_cast<double>(*whole) != number->value) {

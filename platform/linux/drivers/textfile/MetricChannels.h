@@ -20,7 +20,8 @@ struct MetricChannel {
 
 // The driver channels of a text file's metrics.
 //
-//   counter, gauge          a simple channel; a fraction is cut off
+//   counter                 a simple channel that is a counter; a fraction is cut off
+//   gauge                   a simple channel that is a gauge; a fraction is cut off
 //   histogram               a histogram channel
 //   stateset NAME, with     a state channel; the label NAME tells the state
 //     NAME_residency and

@@ -38,6 +38,15 @@ TEST(MetricChannelsTest, CountersAndGaugesAreSimpleChannels) {
       ElementsAre("D/Haptics/Stats/pulses beats = 17", "-/Haptics/-/Peak Level dB = -4"));
 }
 
+TEST(MetricChannelsTest, ACounterIsOneAndAGaugeIsNot) {
+  const auto made = MetricChannels::from("# TYPE a counter\na_total 1\n# TYPE b gauge\nb 1\n");
+
+  const auto& channels = std::get<std::vector<MetricChannel>>(made);
+  ASSERT_EQ(channels.size(), 2U);
+  EXPECT_EQ(channels[0].description.kind, IOReportKind::kCounter);
+  EXPECT_EQ(channels[1].description.kind, IOReportKind::kGauge);
+}
+
 TEST(MetricChannelsTest, TheFormWithoutAnEndIsReadToo) {
   EXPECT_THAT(channelsOf("# HELP pulses_total All pulses.\n"
                          "# TYPE pulses_total counter\n"
@@ -56,7 +65,7 @@ TEST(MetricChannelsTest, CumulativeBucketsAreTakenApart) {
                          "wait_count{group=\"Speaker\",unit=\"us\"} 5\n"
                          "wait_sum{group=\"Speaker\",unit=\"us\"} 91.5\n"),
               ElementsAre("-/Speaker/-/wait us = 0-10:0 10-20:4 20-30:0 30-9223372036854775807:1 "
-                          "min 10 max 9223372036854775807"));
+                          "min 10 max 30"));
 }
 
 TEST(MetricChannelsTest, AStateSetWithItsCountersIsAStateChannel) {

@@ -50,15 +50,6 @@ std::string reasonOf(const SmallFile& file) {
   return std::system_category().message(file.error);
 }
 
-std::string fullName(const ChannelDescription& channel) {
-  std::string name = std::to_string(static_cast<int>(channel.format));
-  for (const auto* part :
-       {&channel.driverName, &channel.group, &channel.subGroup, &channel.channelName}) {
-    name += part->has_value() ? '\n' + std::to_string((*part)->size()) + ':' + **part : "\n-";
-  }
-  return name;
-}
-
 }  // namespace
 
 std::shared_ptr<const Reading> TextfileSource::read() {
@@ -156,11 +147,11 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
 
 void TextfileSource::take(std::vector<MetricChannel>&& channels, Entry& entry) {
   std::map<std::string, Channel> known;
-  for (const Channel& channel : entry.channels) known.emplace(fullName(*channel), channel);
+  for (const Channel& channel : entry.channels) known.emplace(channel->fullName(), channel);
   entry.channels.clear();
   entry.values.clear();
   for (auto& [description, values, line] : channels) {
-    const auto found = known.find(fullName(description));
+    const auto found = known.find(description.fullName());
     entry.channels.push_back(
         found != known.end() && *found->second == description
             ? found->second
@@ -182,7 +173,7 @@ void TextfileSource::chooseChannels() {
     if (!entry.isGood) continue;
     entry.isShown.assign(entry.channels.size(), true);
     for (std::size_t index = 0; index < entry.channels.size(); ++index) {
-      if (told.insert(fullName(*entry.channels[index])).second) continue;
+      if (told.insert(entry.channels[index]->fullName()).second) continue;
       entry.isShown[index] = false;
       // One line a file, however many channels it shares with others.
       if (entry.complaint.empty()) {

@@ -139,7 +139,31 @@ TEST_F(TextfileSourceTest, ADeletedFilesChannelsAreGoneAndNewOnesWhenTheyComeBac
   writePulses("a.prom", 10);
 
   EXPECT_THAT(testing::describe(*makeDelta(samplesOf(before), samplesOf(source_.read()))),
-              ElementsAre("-/Haptics/-/pulses  = 10"));
+              IsEmpty());
+}
+
+TEST_F(TextfileSourceTest, AChannelWhoseUnitOrTypeChangesIsAnother) {
+  write("a.prom", "# TYPE x counter\nx_total{unit=\"s\"} 7\n");
+  const auto before = source_.read();
+  for (const char* text :
+       {"# TYPE x counter\nx_total{unit=\"ms\"} 9\n", "# TYPE x gauge\nx{unit=\"s\"} 9\n"}) {
+    write("a.prom", text);
+
+    EXPECT_THAT(testing::describe(*makeDelta(samplesOf(before), samplesOf(source_.read()))),
+                IsEmpty());
+  }
+}
+
+TEST_F(TextfileSourceTest, AChannelOfAFileThatWasHalfWrittenIsNotInThatReading) {
+  writePulses("a.prom", 3);
+  EXPECT_THAT(show(), SizeIs(1));
+  write("a.prom", kPulses);
+  const auto before = source_.read();
+
+  writePulses("a.prom", 10);
+
+  EXPECT_THAT(testing::describe(*makeDelta(samplesOf(before), samplesOf(source_.read()))),
+              IsEmpty());
 }
 
 TEST_F(TextfileSourceTest, OfAChannelInTwoFilesTheFirstCounts) {
