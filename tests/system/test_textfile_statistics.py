@@ -179,6 +179,17 @@ class TextfileStatisticsTest(unittest.TestCase):
                 self.assertEqual(self.end_session(), {"level": 2})
                 self.reports = 0
 
+    def test_a_file_that_is_deleted_and_written_again_unseen_is_not_reported_in_that_session(self):
+        for value in (40, 140):
+            with self.subTest(value):
+                self.write("level", counter("level", 100))
+                self.start_service()
+                self.start_session()
+                self.delete("level")
+                self.write("level", counter("level", value))
+                self.assertEqual(self.end_session(), {})
+                self.reports = 0
+
     def test_sessions_of_milliseconds_each_report_what_was_counted_and_nothing_else(self):
         sessions = 40
         self.start_service()

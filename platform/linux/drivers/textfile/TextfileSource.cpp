@@ -55,6 +55,8 @@ std::string reasonOf(const SmallFile& file) {
 std::shared_ptr<const Reading> TextfileSource::read() {
   ++round_;
   std::size_t room = kMostBytes;
+  // Before the files are listed: what is deleted from here on is noticed the next time.
+  forgetRemoved();
   const UniqueFd directory = openDirectory(directory_.c_str());
   for (const std::string& file : directory ? list(directory.get()) : std::vector<std::string>()) {
     Entry& entry = entries_[file];
@@ -71,6 +73,14 @@ std::shared_ptr<const Reading> TextfileSource::read() {
     }
   }
   return readings_.finish();
+}
+
+void TextfileSource::forgetRemoved() {
+  const auto [areAll, names] = removedFiles_.take();
+  std::size_t forgotten = 0;
+  for (const std::string& name : names) forgotten += entries_.erase(name);
+  if (areAll) forgotten += std::exchange(entries_, {}).size();
+  isChanged_ |= forgotten > 0;
 }
 
 std::vector<std::string> TextfileSource::list(int directory) {

@@ -14,6 +14,7 @@
 #include "platform/linux/drivers/DriverSource.h"
 #include "platform/linux/drivers/ReadingMaker.h"
 #include "platform/linux/drivers/textfile/MetricChannels.h"
+#include "platform/linux/drivers/textfile/RemovedFiles.h"
 
 namespace halvox::platform::linux_ {
 
@@ -21,14 +22,16 @@ namespace halvox::platform::linux_ {
 // is wrong, too large or no file is left out as a whole, with one line in the log for each change
 // of it, and so are the files for which no room is left. A file that did not change costs a look at
 // its size and times. Files in the order of their names; of a channel that two files tell the first
-// file's counts.
+// file's counts. A file that is deleted takes its channels with it: those of a file of the same
+// name that comes later are others.
 class TextfileSource final : public DriverSource {
  public:
   static constexpr std::size_t kMostFiles = 1000;
   // Of all files together, as what they tell is kept.
   static constexpr std::size_t kMostBytes = 8U << 20U;
 
-  explicit TextfileSource(std::filesystem::path directory) : directory_(std::move(directory)) {}
+  explicit TextfileSource(std::filesystem::path directory)
+      : directory_(std::move(directory)), removedFiles_(directory_) {}
 
   [[nodiscard]] std::string_view name() const override { return "textfile"; }
   [[nodiscard]] std::shared_ptr<const Reading> read() override;
@@ -58,6 +61,7 @@ class TextfileSource final : public DriverSource {
     std::uint64_t round = 0;
   };
 
+  void forgetRemoved();
   void readEntry(int directory, const std::string& file, std::size_t& room, Entry& entry);
   void take(std::vector<MetricChannel>&& channels, Entry& entry);
   void complain(const std::string& file, const std::string& what, Entry& entry);
@@ -65,6 +69,7 @@ class TextfileSource final : public DriverSource {
   void chooseChannels();
 
   const std::filesystem::path directory_;
+  RemovedFiles removedFiles_;
   std::map<std::string, Entry> entries_;  // by file name
   std::uint64_t round_ = 0;
   bool hasToldOfTooMany_ = false;

@@ -142,6 +142,35 @@ TEST_F(TextfileSourceTest, ADeletedFilesChannelsAreGoneAndNewOnesWhenTheyComeBac
               IsEmpty());
 }
 
+// Whether or not anybody read the directory in between.
+TEST_F(TextfileSourceTest, AFileThatIsDeletedAndWrittenAgainBetweenTwoReadingsHasOtherChannels) {
+  for (const int count : {2, 10}) {
+    writePulses("a.prom", 3);
+    const auto before = source_.read();
+    std::filesystem::remove(directory_.path() / "a.prom");
+
+    writePulses("a.prom", count);
+
+    EXPECT_THAT(testing::describe(*makeDelta(samplesOf(before), samplesOf(source_.read()))),
+                IsEmpty());
+  }
+}
+
+TEST_F(TextfileSourceTest, ADirectoryThatIsReplacedHasOtherChannels) {
+  const auto place = directory_.path() / "place";
+  std::filesystem::create_directory(place);
+  TextfileSource source(place);
+  writePulses("place/a.prom", 3);
+  const auto before = source.read();
+  std::filesystem::rename(place, directory_.path() / "old");
+  std::filesystem::create_directory(place);
+
+  writePulses("place/a.prom", 10);
+
+  EXPECT_THAT(testing::describe(*makeDelta(samplesOf(before), samplesOf(source.read()))),
+              IsEmpty());
+}
+
 TEST_F(TextfileSourceTest, AChannelWhoseUnitOrTypeChangesIsAnother) {
   write("a.prom", "# TYPE x counter\nx_total{unit=\"s\"} 7\n");
   const auto before = source_.read();
