@@ -175,8 +175,9 @@ TEST_F(LinuxIOReportServiceTest, AReadingThatWasBegunBeforeIsNotUsedAndTheNextOn
   std::vector<std::jthread> threads;
   for (auto& lines : others) threads.emplace_back([&] { lines = show(sample(found)); });
   while (asked() < askedBefore + kAskers) std::this_thread::yield();
-  readings.allow(std::numeric_limits<std::uint64_t>::max());
+  readings.allow(before + 1);
   asker.join();
+  readings.allow(std::numeric_limits<std::uint64_t>::max());
   threads.clear();
 
   EXPECT_THAT(first, ElementsAre("-/Tx/-/number  = " + std::to_string(before + 1)));
