@@ -80,8 +80,8 @@ class AnalyticsRecords final : public RecordKind {
   bool hasLookedAhead_ = false;
   Statements statements_;
   RecordSpans spans_{"analytics_records", "analytics_spans"};
-  // Increases when the numbers of names may have become wrong: after a rollback, which may have
-  // undone their rows, and with a new connection, whose database may be another.
+  // Increases when the row numbers of names may be wrong: after a rollback, which may have removed
+  // the rows, and after opening a database, which may be another one.
   std::uint64_t generation_ = 1;
   std::uint64_t written_ = 0;       // events in the open transaction, those too large included
   std::uint64_t writtenBytes_ = 0;  // the length of their payloads

@@ -12,7 +12,7 @@ namespace halvox::platform::linux_ {
 enum class DropReason : std::uint8_t {
   kDiskFull,     // no space, over a quota, or over a limit on the size of files
   kLocked,       // another process kept the database locked
-  kLogHeld,      // a reader keeps the write-ahead log from starting anew, and the log is full
+  kLogHeld,      // a reader keeps the write-ahead log from being reused, and the log is full
   kDamaged,      // the file turned out to be broken
   kInputOutput,  // any other failure of SQLite or of the system
   kTooLarge,     // the payload is longer than StoreSizes::payloadBytes

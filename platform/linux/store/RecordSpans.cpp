@@ -137,9 +137,9 @@ SqliteCode RecordSpans::deleteOlderThan(double time, bool& found) {
   statements_.deleteAgedRecords.bind(3, time);
   code = statements_.deleteAgedRecords.run();
   if (code != SQLITE_OK) return code;
-  // Raise the span's first time to the limit, or the same span would be found again. The true first
-  // time may be later, which costs a needless look at most. The row itself goes with the records
-  // after it.
+  // Raise the span's first time to the limit, or the next call would find the same span again. If
+  // the true first time is later, a future call examines the span once in vain. The row is deleted
+  // together with the records after it.
   statements_.shortenSpan.bind(1, span);
   statements_.shortenSpan.bind(2, time);
   return statements_.shortenSpan.run();

@@ -115,9 +115,9 @@ bool SqliteStore::makeReady() {
   return false;
 }
 
-// SQLite can start its write-ahead log anew only when no reader uses an older state of the
-// database. A reader that never finishes makes the log grow without end. When the log is as large
-// as the database may be, records are dropped instead of filling the disk.
+// SQLite can reuse its write-ahead log from the beginning only when no reader needs an older state
+// of the database. A reader that never finishes makes the log grow without end. When the log is as
+// large as the database may be, records are dropped instead of filling the disk.
 bool SqliteStore::logHasRoom() {
   if (files_.logBytes() <= sizes_.databaseBytes) return true;
   const SqliteCode code = sqlite3_wal_checkpoint_v2(database_.get(), nullptr,
@@ -135,7 +135,7 @@ bool SqliteStore::logHasRoom() {
 }
 
 std::optional<StoreError> SqliteStore::openDatabase() {
-  // Closing in good order removes the log, so one that is there was left by a run that was ended.
+  // An orderly close removes the log. A log that exists was left by a run that was killed.
   const bool wasLeftOpen = files_.logBytes() > 0;
   if (auto error = openStoreDatabase(files_, sizes_, database_)) return error;
   if (auto error = useDatabase()) return error;
@@ -157,24 +157,24 @@ std::optional<StoreError> SqliteStore::useDatabase() {
   return error;
 }
 
-// The damaged file holds records of earlier runs and records of this run, which are newer than
-// `extent_`. The new database receives those of this run; all stay in the file that is set aside.
+// Renames the damaged database and starts a new one. Copies the records of this run, which are
+// newer than `extent_`, into the new one. Those of earlier runs are only in the renamed file.
 void SqliteStore::replaceDamaged(const std::string& finding) {
   const StoreExtent extent = extent_;
   abandonDatabase();
   std::string newName;
   if (const auto error = files_.setAside(newName)) return kLog.error("", error->description);
   kLog.error("the database is damaged: ", finding, "; it was set aside as ", newName,
-             "; beginning a new one");
+             ", and a new database takes its place");
   if (const auto error = openStoreDatabase(files_, sizes_, database_)) {
     return kLog.error("", error->description);
   }
   std::string problem;
   const std::uint64_t kept = copyRecordsAfter(extent, newName, database_, problem);
-  kLog.notice("kept the ", kept, " records that were stored since the start");
+  kLog.notice("copied the ", kept, " records that were stored since the start to the new database");
   if (!problem.empty()) {
-    kLog.error("some records that were stored since the start are only in ", newName, ": ",
-               problem);
+    kLog.error("cannot copy all records that were stored since the start; the others are only in ",
+               newName, ": ", problem);
   }
   if (const auto error = useDatabase()) kLog.error("", error->description);
 }
@@ -267,7 +267,7 @@ void SqliteStore::closeDatabase() {
 }
 
 void SqliteStore::abandonDatabase() {
-  check_.stop();  // what it reads may be renamed next
+  check_.stop();  // the caller may rename the file that the check reads
   releaseStatements();
   abandon(database_);
 }

@@ -45,9 +45,9 @@ struct StoreOptions {
 //
 // Failures never reach the callers. When the disk is full, the file is locked, or reading or
 // writing fails, the store drops and counts the records at hand, logs at most one error a second,
-// and tries again with the next records. It renames a damaged database, begins
-// a new one, and copies into it what this run had stored. It creates a file that was deleted. A
-// database that the last run did not close is checked in the background.
+// and tries again with the next records. It creates a file that was deleted. It renames a damaged
+// database, starts a new one, and copies the records of this run into it. A database that the last
+// run did not close is checked in the background.
 //
 // Owned by the platform. open() and close() belong to one thread.
 class SqliteStore {
@@ -126,8 +126,8 @@ class SqliteStore {
   std::uint64_t droppedSinceStored_ = 0;
   OncePerSecond failureLines_;
 
-  StoreExtent extent_;  // of the open database when it was opened
-  StoreCheck check_;    // wakes the writer through the queue, which outlives it
+  StoreExtent extent_;  // the newest records at the time when the database was opened
+  StoreCheck check_;    // wakes the writer through queue_, which stands above and outlives it
   std::thread writer_;
 };
 

@@ -21,16 +21,15 @@ constexpr UnitLog kLog{storeCategory, "StoreCheck"};
 
 using Clock = std::chrono::steady_clock;
 
-// Short enough that the writer's checkpoints are held up for no longer than a commit takes on a
-// slow disk; long enough to read some megabytes from a fast one.
+// Short enough to delay the writer's checkpoints no longer than a commit takes on a slow disk. Long
+// enough to read some megabytes from a fast disk.
 constexpr std::chrono::milliseconds kSlice{20};
 constexpr std::chrono::milliseconds kShortestPause{1};
 constexpr std::chrono::milliseconds kBusyTimeout{250};
 
-// Others come first, for the processor and for the disk. The scheduler's own idle class would be
-// too little: on a busy machine a slice would not end for minutes, and the log would grow
-// meanwhile. Lowering needs no privilege; where the kernel refuses, the pauses alone keep the check
-// out of the way.
+// Lowers the priority of this thread for the processor and for the disk. The scheduler's idle class
+// would be too low: on a busy machine a slice would not end for minutes, and the log would grow
+// meanwhile. Lowering needs no privilege. If the kernel refuses, the pauses alone limit the load.
 void giveWayToOthers() {
   constexpr int kNice = 10;
   static_cast<void>(::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), kNice));
@@ -38,13 +37,14 @@ void giveWayToOthers() {
       ::syscall(SYS_ioprio_set, IOPRIO_WHO_PROCESS, 0, IOPRIO_PRIO_VALUE(IOPRIO_CLASS_IDLE, 0)));
 }
 
-// Reads rows until the slice is over: SQLITE_ROW then, SQLITE_DONE after the last row, or an error.
-// Stepping loads every column, with the pages that a long payload continues on.
+// Reads rows until the time of the slice is over. Returns SQLITE_ROW if there may be more,
+// SQLITE_DONE after the last row, or an error. Stepping also loads the overflow pages of long
+// payloads.
 SqliteCode readSlice(Statement& rows, std::int64_t& last, std::uint64_t& count) {
   const auto end = Clock::now() + kSlice;
   SqliteCode code = SQLITE_ROW;
   while ((code = rows.step()) == SQLITE_ROW) {
-    // In a damaged table numbers may not grow, and then the check would never end.
+    // Numbers must grow. In a damaged table they may not, and the check would never end.
     if (rows.integer(0) <= last) return SQLITE_CORRUPT;
     last = rows.integer(0);
     ++count;
@@ -82,7 +82,7 @@ std::optional<std::string> StoreCheck::finding() {
 void StoreCheck::run(const std::string& file, const StoreExtent& extent, const OnDamage& onDamage) {
   ::pthread_setname_np(::pthread_self(), "halvox-check");
   giveWayToOthers();
-  kLog.info("checking ", file, " in the background: the last run did not close it");
+  kLog.info("checking ", file, " in the background because the last run did not close it");
   Database database;
   std::string what;
   Outcome outcome = Outcome::kUnreadable;
@@ -99,7 +99,7 @@ void StoreCheck::run(const std::string& file, const StoreExtent& extent, const O
     case Outcome::kStopped:
       return;
     case Outcome::kUnreadable:
-      kLog.error("cannot check ", file, ": ", what, "; giving up until the next start");
+      kLog.error("cannot check ", file, ": ", what, "; it is not checked before the next start");
       return;
     case Outcome::kDamaged:
       break;
@@ -113,7 +113,8 @@ void StoreCheck::run(const std::string& file, const StoreExtent& extent, const O
 
 StoreCheck::Outcome StoreCheck::readAll(Database& database, const StoreExtent& extent,
                                         std::string& what) {
-  // The names are few, and the only table with an index, which reading rows does not reach.
+  // The table of names is the only one with an index, and reading rows does not read an index. The
+  // names are few, so one slice is enough.
   Statement names;
   SqliteCode code = database.prepare("PRAGMA quick_check(event_names)", names);
   if (code == SQLITE_OK) code = names.step();

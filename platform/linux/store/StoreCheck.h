@@ -12,25 +12,26 @@
 
 namespace halvox::platform::linux_ {
 
-// Reads through a database that an earlier run did not close, while the store already serves.
+// Checks a database that an earlier run did not close, while the store already uses it.
 //
 //   made --begin()--> reading --> sound, damaged or given up
 //                        |
 //                        +--stop()--> stopped
 //
-// A killed service leaves its database sound; a failing disk, a power cut or a stray program may
-// not. Reading a large database takes minutes on a cold disk, so it runs on a thread of its own at
-// low priority, in slices: every slice ends its transaction, because an open one would keep the
-// write-ahead log from beginning anew, and is followed by a pause of its own length.
+// A killed service leaves its database sound. A failing disk, a power cut or another program may
+// damage it. Reading a large database takes minutes on a cold disk, so a thread of its own with low
+// priority reads it in slices. Each slice ends its transaction, because an open one would keep the
+// writer from reusing the write-ahead log. After each slice the thread pauses for the same time.
 //
-// It reads the records that were there when the database was opened; later ones were written by
-// this run. Only damage is reported. A file that cannot be read at the moment is an error line, and
-// the check is given up: the store meets such an error itself when it needs the page.
+// Reads only the records that existed when the database was opened: this run has written the later
+// ones. Reports only damage. When the file cannot be read for another reason, logs an error and
+// gives up: the store notices such an error itself when it needs the page.
 //
-// Owned by the store. begin() and stop() are for the store's own threads, one at a time.
+// Owned by the store. Only the store's own threads call begin() and stop(), one at a time.
 class StoreCheck {
  public:
-  // Runs on the thread of the check, once, after finding() has its value. Must not call stop().
+  // Called at most once, on the thread of the check, after finding() has its value. Must not call
+  // stop(), which would wait for itself.
   using OnDamage = std::function<void()>;
 
   StoreCheck() = default;
@@ -38,11 +39,11 @@ class StoreCheck {
   StoreCheck& operator=(const StoreCheck&) = delete;
   ~StoreCheck() { stop(); }
 
-  // Stops a check that is running, and begins one of that file.
+  // Stops a running check and starts to check `file`.
   void begin(const std::string& file, const StoreExtent& extent, OnDamage onDamage);
-  // Blocks until the thread has ended: at most one slice. Forgets what was found.
+  // Ends the thread and forgets its finding. Blocks for at most one slice. Idempotent.
   void stop();
-  // What is damaged; none while nothing was found. Any thread.
+  // Any thread. Describes the damage; std::nullopt while none was found.
   [[nodiscard]] std::optional<std::string> finding() HALVOX_EXCLUDES(mutex_);
 
  private:
@@ -52,11 +53,11 @@ class StoreCheck {
   [[nodiscard]] Outcome readAll(Database& database, const StoreExtent& extent, std::string& what);
   [[nodiscard]] Outcome readTable(Database& database, const std::string& table, std::int64_t newest,
                                   std::string& what);
-  // False when the check is to stop.
+  // Returns false when the check must stop.
   [[nodiscard]] bool pause(std::chrono::steady_clock::duration length) HALVOX_EXCLUDES(mutex_);
 
   std::thread thread_;
-  std::uint64_t records_ = 0;  // read so far; the thread's
+  std::uint64_t records_ = 0;  // read so far; used by the thread only
   Mutex mutex_;
   Condition stopping_;
   bool isStopping_ HALVOX_GUARDED_BY(mutex_) = false;

@@ -28,7 +28,7 @@ class StoreCheckTest : public StoreTest {
     start();
     for (std::int64_t number = 0; number < kEvents; ++number) send(number);
     ASSERT_TRUE(allIsStored());
-    // Into the database itself, so that the log holds only a little.
+    // Copy the log into the database, so that the log holds only a few records.
     execute(database(), "PRAGMA wal_checkpoint(FULL)");
     send(kEvents);
     ASSERT_TRUE(allIsStored());
@@ -44,7 +44,7 @@ class StoreCheckTest : public StoreTest {
     content.replace(content.size() / 2, 20'000, std::string(20'000, '\xA5'));
     writeFile(database(), content);
   }
-  // The check gives way to everything else that runs on the machine, so these wait long.
+  // The check has a low priority, so these wait for a long time on a busy machine.
   bool eventuallySetAside() {
     return patiently([this] { return !setAsideFiles().empty(); });
   }
@@ -79,7 +79,7 @@ TEST_F(StoreCheckTest, FindsNoDamageInADatabaseWhoseServiceWasKilled) {
 TEST_F(StoreCheckTest, SaysHowManyRecordsItRead) {
   leaveKilledStore();
   start();
-  // The events and the spans of 512 records that sum up their times.
+  // The events, and one span for every 512 records.
   EXPECT_TRUE(eventuallyLogged(LogLevel::kInfo, "read 4009 records"))
       << ::testing::PrintToString(platform.log.texts(LogLevel::kInfo));
 }
@@ -162,7 +162,7 @@ TEST_F(StoreCheckTest, ReadsNothingAfterAnOrderlyEnd) {
 
 TEST_F(StoreCheckTest, FindsADamagedTableOfNames) {
   leaveKilledStore();
-  // Both pages of the table and of its index are among the first.
+  // The pages of the table and of its index are among the first.
   const auto root = rows(
       database(), "SELECT rootpage FROM sqlite_schema WHERE name LIKE 'sqlite_autoindex_event%'");
   ASSERT_THAT(root, SizeIs(1));

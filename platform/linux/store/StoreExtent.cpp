@@ -5,7 +5,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Opens a second file on a connection, under the name `damaged`, for the life of this object.
+// Attaches a second file to a connection, under the name `damaged`, while this object lives.
 class AttachedFile {
  public:
   AttachedFile(Database& database, const std::string& file) : database_(database) {
@@ -27,7 +27,7 @@ class AttachedFile {
   SqliteCode code_ = SQLITE_OK;
 };
 
-// Copies one kind in one transaction, so that its records and its spans always match.
+// Copies one kind in one transaction, so that its records and spans agree after any failure.
 SqliteCode copyKind(const KindTables& tables, std::int64_t newest, Database& database) {
   const std::string records(tables.records);
   const std::string spans(tables.spans);
@@ -36,8 +36,8 @@ SqliteCode copyKind(const KindTables& tables, std::int64_t newest, Database& dat
       "INSERT INTO main." +
       records + " SELECT * FROM damaged." + records + " WHERE id > " + std::to_string(newest) +
       ";"
-      // The first of these spans may also cover older records. A span may be wider than its
-      // records are: readers only use it to skip records.
+      // The first of these spans may also cover records that are not copied. A span may cover more
+      // time than its records: readers use it only to skip records.
       "INSERT INTO main." +
       spans + " SELECT * FROM damaged." + spans +
       " WHERE span >= " + std::to_string((newest + 1) / kRecordsPerSpan) +
@@ -73,7 +73,7 @@ std::uint64_t copyRecordsAfter(const StoreExtent& extent, const std::string& fil
     note(file);
     return 0;
   }
-  // Records refer to names by number, so every name keeps its number.
+  // Copy all names with their numbers, because records refer to names by number.
   if (database.execute("INSERT INTO main.event_names SELECT * FROM damaged.event_names") !=
       SQLITE_OK) {
     note("event_names");

@@ -10,7 +10,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The tables of one kind of record, as the schema makes them.
+// The tables of one kind of record. They must agree with the migrations in StoreSchema.cpp.
 struct KindTables {
   std::string_view records;
   std::string_view spans;
@@ -24,20 +24,20 @@ inline constexpr std::array<KindTables, 5> kKindTables{{
     {"snapshot_records", "snapshot_spans"},
 }};
 
-// The number of the newest record of each kind, in the order of kKindTables; 0 when there is none.
-// Taken when a store opens its database, it separates what earlier runs wrote from what this run
-// writes, because record numbers only grow.
+// The number of the newest record of each kind, in the order of kKindTables; 0 if there is none.
+// A store takes it when it opens its database. Record numbers only grow, so it separates the
+// records of earlier runs from those of this run. A plain value.
 struct StoreExtent {
   std::array<std::int64_t, kKindTables.size()> newest{};
 
-  // Reads the last page of each table. SQLITE_OK or an error.
+  // Reads the extent, which needs only the last page of each table. Returns SQLITE_OK or an error.
   [[nodiscard]] static SqliteCode read(Database& database, StoreExtent& extent);
 };
 
 // Copies the records that are newer than `extent` from the database in `file` into `database`,
-// which must be open for writing, have all tables, and hold no record. A kind that cannot be read
-// is skipped. Returns how many records were copied; `problem` says what could not be, and is empty
-// when everything was. Blocks on the disk.
+// which must be open for writing, have all tables and hold no records. Skips a kind that cannot be
+// read. Returns the number of copied records. `problem` names what could not be copied, and is
+// empty if everything was. Blocks on the disk.
 [[nodiscard]] std::uint64_t copyRecordsAfter(const StoreExtent& extent, const std::string& file,
                                              Database& database, std::string& problem);
 

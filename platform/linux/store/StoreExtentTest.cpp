@@ -11,7 +11,7 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
-// A database that holds events 1 to 1000, of which the first 600 are older than its extent.
+// A fixture with a database of 1,000 events. The extent was taken after the first 600.
 class StoreExtentTest : public StoreTest {
  protected:
   StoreExtentTest() {

@@ -17,8 +17,8 @@ namespace {
 constexpr std::string_view kLockFileName = "halvox.lock";
 constexpr std::array<std::string_view, 3> kSuffixes{"", "-wal", "-shm"};
 constexpr mode_t kFileMode = 0640;
-// Names have a resolution of one second. Ends the search in a directory full of such files; the
-// rename then replaces the last one tried.
+// The time in a name has a resolution of one second; a number distinguishes equal times. This bound
+// ends the search in a directory full of such files. The rename then replaces the last one tried.
 constexpr int kMostNamesTried = 100;
 
 StoreError failure(StoreError::Kind kind, const std::filesystem::path& path, std::string_view what,
@@ -65,7 +65,7 @@ StoreFiles::StoreFiles(const std::filesystem::path& directory)
 
 std::optional<StoreError> StoreFiles::claimDirectory() {
   struct stat status {};
-  // A lock on a file without a name keeps nobody out: another service would create a new file.
+  // The lock is useless once its file was removed: another service would create and lock a new one.
   if (lock_ && ::fstat(lock_.get(), &status) == 0 && status.st_nlink > 0) return std::nullopt;
   std::error_code error;
   std::filesystem::create_directories(directory_, error);

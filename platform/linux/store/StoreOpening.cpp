@@ -45,7 +45,7 @@ Attempt judged(SqliteCode code, const StoreFiles& files, const Database& databas
 }
 
 std::string pragmas(const StoreSizes& sizes) {
-  // The first two must precede the first table: SQLite lays an existing file out anew only in a
+  // The first two must precede the first table: for an existing file SQLite applies them only in a
   // full VACUUM. Deleted records leave free pages that later records fill. The page map that
   // incremental vacuum needs has no measurable cost and lets the file shrink after its limit was
   // lowered. With WAL and NORMAL a kill loses nothing that was committed; only a power cut can.

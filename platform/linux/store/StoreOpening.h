@@ -20,9 +20,9 @@ struct StoreSizes {
 };
 
 // Opens the store's database for writing. Creates the directory, the file and the tables that are
-// missing, and migrates an older schema. Reads only the first pages,
-// however large the file is. When they show damage it renames the database, logs an error and
-// starts with an empty one. Leaves a database of a newer version untouched and returns an error.
+// missing, and migrates an older schema. Reads only the first pages, however large the file is.
+// When they show damage, renames the database, logs an error and starts with an empty one. Leaves
+// a database of a newer version untouched and returns an error.
 //
 // Blocks on the disk, and up to 250 ms for each lock that another process holds. `files` and
 // `database` belong to the caller.

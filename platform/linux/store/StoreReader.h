@@ -66,7 +66,7 @@ struct StoredRecord {
 // any of them.
 //
 // Reads in pieces and holds no lock and no snapshot while a callback runs. A snapshot would keep
-// the service from starting its write-ahead log anew, and a slow reader would make the log grow.
+// the service from reusing its write-ahead log, and a slow reader would make the log grow.
 class StoreReader {
  public:
   using EventCallback = std::function<void(const StoredEvent&)>;

@@ -28,13 +28,12 @@ struct QueueLimits {
 
 // Connects the threads that add records with the store's writer: counts waiting records, wakes the
 // writer as seldom as possible, and makes callers wait when too many wait. The records themselves
-// are in their RecordKind, which moves them while it holds this queue's lock: one lock for all
-// kinds, and one wake-up.
+// are in their RecordKind, which the queue calls under its lock: one lock and one wake-up serve all
+// kinds.
 //
-// The writer sleeps without a timer while nothing waits. The first record wakes it. When the first
-// record comes within `gatherTime` of the last round, the writer waits until that time is over or
-// `gatherRecords` wait. A busy service thus commits seldom and does not wake the writer for every
-// record.
+// The writer sleeps without a timer while nothing waits. The first record wakes it. If its last
+// round was less than `gatherTime` ago, it then sleeps until that time is over or `gatherRecords`
+// wait. A busy service thus commits seldom, and does not wake the writer for every record.
 //
 // Owned by the store. Cannot fail.
 class WriterQueue {
@@ -64,16 +63,17 @@ class WriterQueue {
   // the records that are queued.
   void close() HALVOX_EXCLUDES(mutex_);
 
-  // Any thread. Makes the next take() return, even when nothing is queued.
+  // Any thread. Makes the current or next take() return at once, even if nothing is queued.
   void requestRound() HALVOX_EXCLUDES(mutex_);
 
   // Writer only. Waits for a record, then until `notBefore` or until `gatherRecords` wait, and runs
-  // `take` under the lock. `take` must take everything that is queued. Does not wait after a
-  // requestRound(), and then need not run `take`. Returns false, without running it, when the queue
-  // is closed and empty.
+  // `take` under the lock. `take` must take everything that is queued. Returns false, without
+  // running it, when the queue is closed and empty. After requestRound() it returns true at once,
+  // and runs `take` only if something is queued.
   bool take(Time notBefore, const std::function<void()>& take) HALVOX_EXCLUDES(mutex_);
-  // Writer only. `records` of the taken records left the store's memory, with payloads of `bytes`.
-  // The queue attributes the time since the last take(), finish() or disregardTime() to them.
+  // Writer only. `records` of the taken records were stored or dropped; their payloads had `bytes`.
+  // The queue takes the time since the last take(), finish() or disregardTime() for the time that
+  // they needed.
   void finish(std::uint64_t records, std::uint64_t bytes) HALVOX_EXCLUDES(mutex_);
   // Writer only. The time so far was spent on a failure: finish() must not count it as writing.
   void disregardTime() HALVOX_EXCLUDES(mutex_);
