@@ -52,8 +52,8 @@ using platform::TLMReportingSession;
 using platform::TLMSecureHierarchyToken;
 using platform::Value;
 
-// Services of which there is nothing: what is given to them goes nowhere and nothing comes from
-// them.
+// Services that do nothing: they discard what they receive, and return no value or an error. For
+// benchmarks.
 
 class AbsentPreferences final : public PreferenceService {
  public:

@@ -1,5 +1,5 @@
-// What a job costs on its way through a queue with its own thread: helped by the thread that adds
-// it, and handed over; beside a bare call of the same job.
+// The cost of a job on a queue with its own thread, compared with a bare call of the same job. The
+// job runs either on the thread that adds it ("helped") or on the queue's thread ("handed over").
 
 #include <cstdint>
 #include <future>
@@ -23,7 +23,7 @@ struct Fixture {
       "com.tarno.halvox.bench", QualityOfService::kUserInteractive, QueueThreading::kOwnThread);
 };
 
-// A job of the size of a request's: it holds a reference and three numbers.
+// Makes a job as large as that of a request: it holds a reference and three numbers.
 Job makeJob(const std::shared_ptr<std::uint64_t>& total) {
   return [total, a = std::uint64_t{1}, b = std::uint64_t{2}, c = std::uint64_t{3}] {
     *total += a + b + c;

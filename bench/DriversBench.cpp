@@ -1,6 +1,6 @@
-// What driver statistics cost: 500 channels in text files, in eight groups that are sampled one
-// after the other as a session's start and stop do, by 64 sessions at once. With the argument
-// "memory": what the snapshots of these sessions hold.
+// The cost of driver statistics: 500 channels in text files and eight groups, for one session and
+// for 64 sessions at once. The groups are sampled one after the other, as the start and the stop of
+// a session do. With the argument "memory": the memory that the snapshots of the sessions hold.
 
 #include <algorithm>
 #include <array>
@@ -38,7 +38,7 @@ constexpr std::chrono::milliseconds kPause{5};
 constexpr std::array kGroups{
     "TarnoQ7AMP", "Speaker", "MCA", "Haptics", "StateTransitionTimes_ms", "Rx", "Tx", "IOSndFam2"};
 
-// Tells when a reading came too late, because then what is measured is not what it should be.
+// Shows errors. The service logs one when a reading was too late; the measurement is then invalid.
 class ShownLog final : public LogCategory {
  public:
   ShownLog() : LogCategory(LogLevel::kError) {}
@@ -61,7 +61,7 @@ void writeFiles(const std::filesystem::path& directory, int round) {
   }
 }
 
-// Samples as a session does.
+// Takes samples as a session does.
 class Sampler {
  public:
   explicit Sampler(LinuxIOReportService& service) : service_(service) {
@@ -79,7 +79,7 @@ class Sampler {
     }
     return samples;
   }
-  // Samples again, and goes through all differences.
+  // Takes samples again and visits all differences. Returns their number.
   std::size_t report(const SnapShot& before) const {
     std::size_t count = 0;
     const auto moment = service_.makeMoment();
@@ -127,7 +127,7 @@ void measureOne(const Sampler& sampler) {
   tell("report, one session", reports);
 }
 
-// All sessions start and stop on one queue, as those of the service do.
+// Starts and stops all sessions on one queue, as the service does.
 void measureQueue(const Sampler& sampler, const std::filesystem::path& directory) {
   std::vector<double> snapShots;
   std::vector<double> reports;
@@ -197,7 +197,7 @@ void measureTimes(const Sampler& sampler, const std::filesystem::path& directory
 
 int main(int argc, char** argv) {
   const bool isOfMemory = argc > 1 && std::string_view(argv[1]) == "memory";
-  // All threads' memory in one account.
+  // One arena for all threads: mallinfo2() must count the memory of all.
   if (isOfMemory) mallopt(M_ARENA_MAX, 1);
   std::string name = (std::filesystem::temp_directory_path() / "halvox-bench-XXXXXX").string();
   if (mkdtemp(name.data()) == nullptr) return 1;

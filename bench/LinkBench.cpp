@@ -1,6 +1,6 @@
-// Messages a second through the back-end of the link to a JetStream, beside the client library's
-// own asynchronous publish of the same bytes to the same stream in the same run. Acknowledgements
-// are waited for in both. Needs a server with JetStream:
+// Measures how many messages a second the link's back-end publishes to a JetStream stream. Compares
+// this with the client library's own asynchronous publishing of the same bytes to the same stream
+// in the same run. Both wait for all acknowledgements. Needs a server with JetStream:
 //
 //   halvox_link_bench nats://127.0.0.1:4222 [MESSAGES [ROUNDS]]
 #include <algorithm>
@@ -62,7 +62,7 @@ double measureBackend(TLMReportingService& link, std::size_t messages) {
   link.TLMReportingStartConfiguration(
       session, [&](const std::optional<Array>& servers) { found.set_value(servers.has_value()); });
   if (!found.get_future().get()) {
-    std::fprintf(stderr, "halvox_link_bench: no server\n");
+    std::fprintf(stderr, "halvox_link_bench: cannot connect to the server\n");
     std::exit(EXIT_FAILURE);
   }
   const auto began = Clock::now();
@@ -75,7 +75,7 @@ double measureBackend(TLMReportingService& link, std::size_t messages) {
   return perSecond(messages, began);
 }
 
-// The same bytes: made beforehand, with the same subject and a header of the same length.
+// Publishes the bytes of a stored message under the same subject, with a header of the same length.
 double measureLibrary(jsCtx* context, const std::string& body, std::size_t messages) {
   static int round = 0;
   ++round;
@@ -97,7 +97,7 @@ double measureLibrary(jsCtx* context, const std::string& body, std::size_t messa
   return perSecond(messages, began);
 }
 
-// One of the messages that the back-end stored.
+// Returns one of the messages that the back-end published.
 std::string storedBody(jsCtx* context) {
   NatsMessage message;
   if (js_GetLastMsg(message.out(), context, "HALVOX", "halvox.playback_session.1", nullptr,

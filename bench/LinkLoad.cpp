@@ -1,6 +1,7 @@
-// Messages a second from a client through the service and its link into the local store and onto a
-// JetStream, beside the client library's own asynchronous publish of the same bytes to the same
-// server in the same run. A message counts when it is stored there. Runs a server of its own:
+// Measures how many messages a second one client gets through the service and its link, to the
+// local store and to a JetStream stream. Compares this with the client library's own asynchronous
+// publishing of the same bytes to the same server in the same run. A message counts when it is
+// stored. Runs its own server:
 //
 //   halvox_link_load [MESSAGES [ROUNDS]]
 #include <algorithm>
@@ -39,15 +40,15 @@ using Statement = UniqueHandle<sqlite3_stmt*, sqlite3_finalize>;
 using StreamInfo = UniqueHandle<jsStreamInfo*, jsStreamInfo_Destroy>;
 
 constexpr const char* kStream = "HALVOX";
-constexpr std::int64_t kWindow = 256;    // requests without an answer, as our client library has
-constexpr std::int64_t kPending = 8192;  // messages without one, of the plain library
+constexpr std::int64_t kWindow = 256;    // unanswered requests, as in our client library
+constexpr std::int64_t kPending = 8192;  // unacknowledged messages of the plain library
 constexpr std::int64_t kWarmUp = 2000;
 constexpr std::chrono::milliseconds kPoll{2};
 constexpr std::chrono::minutes kPatience{2};
 
 struct Result {
   double perSecond;
-  double cpuMicros;  // a message, of the process that publishes
+  double cpuMicros;  // CPU time per message of the process that publishes
 };
 
 std::chrono::nanoseconds ownCpu() {
@@ -56,7 +57,7 @@ std::chrono::nanoseconds ownCpu() {
   return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
 
-// One measurement: from its making to result(), with the CPU time that `cpu` gives.
+// Measures wall-clock time, and the CPU time that `cpu` returns, from construction to result().
 class Stopwatch {
  public:
   using Cpu = std::function<std::chrono::nanoseconds()>;
@@ -77,7 +78,7 @@ class Stopwatch {
 
 void waitUntil(const char* what, const std::function<bool()>& isTrue) {
   for (const auto end = Clock::now() + kPatience; !isTrue(); std::this_thread::sleep_for(kPoll)) {
-    if (Clock::now() > end) throw std::runtime_error(std::string("waited in vain for ") + what);
+    if (Clock::now() > end) throw std::runtime_error(std::string("timed out waiting for ") + what);
   }
 }
 
@@ -89,12 +90,12 @@ int freePort() {
   socklen_t length = sizeof address;
   auto* const any = reinterpret_cast<sockaddr*>(&address);
   if (::bind(socket.get(), any, length) != 0 || ::getsockname(socket.get(), any, &length) != 0) {
-    throw std::runtime_error("no free port");
+    throw std::runtime_error("cannot find a free port");
   }
   return ntohs(address.sin_port);
 }
 
-// A server with JetStream, and a connection of the plain library to it.
+// Runs a server with JetStream and connects the plain library to it.
 class JetStream {
  public:
   JetStream()
@@ -110,7 +111,7 @@ class JetStream {
     options.PublishAsync.MaxPending = kPending;
     options.PublishAsync.StallWait = 10'000;
     if (natsConnection_JetStream(context_.out(), connection_.get(), &options) != NATS_OK) {
-      throw std::runtime_error("no JetStream");
+      throw std::runtime_error("the server does not offer JetStream");
     }
   }
 
@@ -123,21 +124,21 @@ class JetStream {
     return isThere ? static_cast<std::int64_t>(info.get()->State.Msgs) : 0;
   }
 
-  // One of the messages there.
+  // Returns one of the messages on the stream.
   [[nodiscard]] NatsMessage message() const {
     NatsMessage message;
     if (js_GetMsg(message.out(), context_.get(), kStream, kWarmUp / 2, nullptr, nullptr) !=
         NATS_OK) {
-      throw std::runtime_error("no message on the stream");
+      throw std::runtime_error("cannot read a message from the stream");
     }
     return message;
   }
 
-  // Publishes `like` over and over, with identifiers as long as its own.
+  // Publishes copies of `like`, each with an identifier of the same length.
   Result publish(const NatsMessage& like, std::int64_t messages) {
     const char* id = nullptr;
     if (natsMsgHeader_Get(like.get(), "Nats-Msg-Id", &id) != NATS_OK) {
-      throw std::runtime_error("a message without an identifier");
+      throw std::runtime_error("a message on the stream has no identifier");
     }
     const auto width = static_cast<int>(std::string(id).size());
     jsPubOptions options;
@@ -156,7 +157,7 @@ class JetStream {
     options.MaxWait = 60'000;
     options.MsgId = nullptr;
     if (js_PublishAsyncComplete(context_.get(), &options) != NATS_OK) {
-      throw std::runtime_error("the plain library got no acknowledgements");
+      throw std::runtime_error("the plain library received no acknowledgements in time");
     }
     return watch.result(messages);
   }
@@ -173,7 +174,7 @@ class JetStream {
 std::int64_t storedMessages(const std::string& path) {
   Database database;
   Statement statement;
-  // The service may be making the file; then the next look tells.
+  // Fails while the service is still creating the file. The caller tries again.
   if (sqlite3_open_v2(path.c_str(), database.out(), SQLITE_OPEN_READONLY, nullptr) != SQLITE_OK ||
       sqlite3_prepare_v2(database.get(), "SELECT max(id) FROM link_message_records", -1,
                          statement.out(), nullptr) != SQLITE_OK ||
@@ -183,7 +184,7 @@ std::int64_t storedMessages(const std::string& path) {
   return sqlite3_column_int64(statement.get(), 0);
 }
 
-// What one client gets through the service, counted by `stored`.
+// Sends messages from one client through the service until `stored` has counted all of them.
 Result through(const Server& server, std::int64_t messages,
                const std::function<std::int64_t()>& stored) {
   const MessageShape shape;

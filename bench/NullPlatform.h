@@ -23,9 +23,9 @@
 
 namespace halvox::bench {
 
-// Services that cost as little as a service can, so that a benchmark measures the inner ring alone:
-// nobody wants an event, a trace or a line of the log, and queued jobs wait in one list until the
-// benchmark runs them.
+// Platform services that cost as little as possible, so that a benchmark measures the inner ring
+// alone. No event, trace or log line is wanted. Queued jobs wait in one list until the benchmark
+// runs them. For one thread.
 
 class NullAnalytics final : public platform::AnalyticsService {
  public:
@@ -34,7 +34,7 @@ class NullAnalytics final : public platform::AnalyticsService {
                               platform::AnalyticsPayloadBuilder /*builder*/) override {}
 };
 
-// Goes on by a millisecond at every look.
+// Advances by one millisecond at each call of currentDate().
 class SteppingClock final : public platform::ClockService {
  public:
   platform::Date currentDate() const override { return {1.7e9 + 0.001 * ++looks_}; }
@@ -73,7 +73,7 @@ class ListQueue final : public platform::DispatchQueue {
   void async(platform::JobWeight /*weight*/, platform::Job job) override {
     jobs_.push_back(std::move(job));
   }
-  // Nothing that is measured waits for another: it goes on at its next turn.
+  // Does not wait: no measured code signals the semaphore. Continues at the queue's next turn.
   void waitOn(std::shared_ptr<platform::DispatchSemaphore> /*semaphore*/,
               std::optional<std::chrono::nanoseconds> /*timeout*/,
               std::function<void(platform::WaitOutcome)> then) override {
@@ -150,7 +150,7 @@ class NullLog final : public platform::LogService {
     return category_;
   }
   void setLevel(platform::LogLevel level) { category_.setLevel(level); }
-  // Length of all lines so far.
+  // The total length of all lines so far.
   [[nodiscard]] std::size_t bytes() const { return category_.bytes(); }
 
  private:
@@ -177,7 +177,8 @@ class MapStatistics final : public platform::StatisticsService {
   std::map<std::pair<std::string, std::string>, platform::Counter> counters_;
 };
 
-// All of them, installed for good: code under test remembers categories and counters.
+// Owns all services and installs them. Must live as long as the process: the code under test keeps
+// references to log categories and counters.
 struct NullPlatform {
   explicit NullPlatform(platform::LogLevel level) : log(level) {
     platform::installServices({.analytics = analytics,
@@ -228,7 +229,7 @@ struct NullPlatform {
   MapStatistics statistics;
 };
 
-// The one of the program; logs errors only, as nobody reads the log of a benchmark.
+// The instance of the program, which is never destroyed. Only errors are enabled in its log.
 inline NullPlatform& nullPlatform() {
   static auto* instance = new NullPlatform(platform::LogLevel::kError);
   return *instance;

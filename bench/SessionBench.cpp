@@ -10,9 +10,9 @@
 #include "service/HVReportingServiceDelegate.h"
 #include "session/HVReportingSession.h"
 
-// What one message costs between the connection and the back-ends: queued by the client object,
-// carried out on the reporting queue, stamped, offered to the analytics service (which wants
-// nothing), compared and recorded. The connection and the queue themselves are not in it.
+// The cost of one message between the connection and the back-ends. The client object queues it;
+// the reporting queue stamps it, offers it to the analytics service (which wants no event),
+// compares it and records it. The cost of the connection and of the queue itself is not included.
 
 namespace halvox {
 namespace {
@@ -32,7 +32,7 @@ std::vector<Dictionary> makeMessages(std::int64_t first) {
   return messages;
 }
 
-// A service whose last client sends to a session of its own, with others beside it.
+// A service with several clients and sessions. The last client sends to its own session.
 class Scene {
  public:
   Scene(std::int64_t clients, std::int64_t sessions)
@@ -61,7 +61,7 @@ class Scene {
 
   HVReportingClientServerInstance& sender() { return *connections_.back()->object; }
 
-  // Holds what a real connection would hold.
+  // Holds the same objects as a real connection.
   struct Connection final : platform::NSXPCConnection {
     platform::ProcessID processIdentifier() const override { return 100; }
     std::string description() const override { return "bench"; }
@@ -144,8 +144,8 @@ void BM_SessionSendMessage(benchmark::State& state, bool redundant) {
   state.SetItemsProcessed(state.iterations());
 }
 
-// Starting and stopping one session among others that are started: both log all of them, at the
-// level that is on unless somebody turned it off.
+// Starts and stops one session among other started ones. Both operations log a line that lists all
+// sessions, at a level that is enabled by default.
 void BM_RestartAmong(benchmark::State& state) {
   Scene scene(1, state.range(0));
   nullPlatform().log.setLevel(platform::LogLevel::kDefault);

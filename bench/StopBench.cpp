@@ -9,9 +9,9 @@
 #include "bench/TypicalMessage.h"
 #include "session/HVReportingSession.h"
 
-// What it costs to stop a session with a long history: its walk for volume, its summary event, and
-// letting go of it. Counts the memory too: `peak_ratio` is the most that the process had beside
-// what it had before the session, in units of what the history had when the stop began.
+// The cost of stopping a session with a long history: computing its volume messages and its summary
+// event, and freeing the history. `peak_ratio` is the peak memory of the process above what it used
+// before the session, divided by the memory of the history at the start of the stop.
 
 namespace halvox {
 namespace {
@@ -33,7 +33,8 @@ Dictionary makeStampedMessage(std::int64_t number) {
   return message;
 }
 
-// Another volume each time, held for longer than the least time: every message ends an interval.
+// Makes messages with changing volumes, each held longer than the minimum time, so that every
+// message ends an interval.
 Dictionary makeVolumeMessage(std::int64_t number) {
   Dictionary message;
   message.set("RQSessionVolume", static_cast<double>(number % 16) / 16);

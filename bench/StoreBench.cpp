@@ -1,4 +1,4 @@
-// What one message costs the store: two events of equal payload, 14 fields each.
+// The cost of one message in the store: two events with equal payloads of 14 fields.
 
 #include <chrono>
 #include <filesystem>
@@ -55,7 +55,7 @@ Dictionary makeMessage() {
   return message;
 }
 
-// What the analytics bridge does when its payload is asked for.
+// Builds the payload as the analytics bridge does.
 AnalyticsPayloadBuilder makeBuilder(const Dictionary& message) {
   return [message] {
     Dictionary payload = message;
@@ -106,8 +106,8 @@ double cpuSeconds(int who) {
   return seconds(use.ru_utime) + seconds(use.ru_stime);
 }
 
-// The whole path, all threads: two events stored for each message. The rate is held below what the
-// writer can carry, as backpressure does it, so that callers never wait.
+// The whole path on all threads: two stored events for each message. Pauses while backpressure is
+// high, as the service does, so that the caller never waits in the queue.
 void storeMessage(benchmark::State& state) {
   Bench bench(static_cast<std::uint32_t>(state.range(0)));
   const Dictionary message = makeMessage();
@@ -134,7 +134,7 @@ void storeMessage(benchmark::State& state) {
   state.counters["caller_us_per_message"] = caller / static_cast<double>(messages) * 1e6;
   state.counters["resident_mib"] = static_cast<double>(use.ru_maxrss) / 1024;
 }
-// With room for all, and with old events being deleted all the time.
+// 512 MB have room for all events; with 32 MB old events are deleted all the time.
 BENCHMARK(storeMessage)
     ->ArgName("megabytes")
     ->Arg(512)
@@ -143,7 +143,8 @@ BENCHMARK(storeMessage)
     ->Unit(benchmark::kMicrosecond)
     ->UseRealTime();
 
-// The caller's side alone, while the writer is asleep: two names asked for, two events sent.
+// The caller's side alone: two names tested and two events queued. Timing pauses while the writer
+// catches up.
 void handOver(benchmark::State& state) {
   Bench bench;
   const Dictionary message = makeMessage();

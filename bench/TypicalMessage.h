@@ -6,8 +6,8 @@
 
 namespace halvox::bench {
 
-// Ten fields, as audio frameworks send them; the number makes it differ from all others. There is
-// room for the stamps that the service adds.
+// Makes a message with ten fields, as audio frameworks send them. `number` makes it different from
+// all others. Reserves room for the stamps that the service adds.
 inline platform::Dictionary makeMessage(std::int64_t number) {
   platform::Dictionary message;
   message.reserve(14);

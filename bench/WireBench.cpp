@@ -1,4 +1,4 @@
-// What reading a message from the wire and answering it costs, piece by piece.
+// The cost of the single steps of reading a message from the wire and answering it.
 
 #include <algorithm>
 #include <string>
@@ -15,7 +15,7 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// A message of ten fields, as clients send them.
+// Returns the frame of a message with ten fields.
 std::string sendMessageFrame(bool bigEndian) {
   const auto* golden = std::ranges::find_if(kGoldenFrames, [&](const GoldenFrame& frame) {
     return frame.name == "send_message" && frame.bigEndian == bigEndian;
@@ -35,7 +35,7 @@ void readHeader(benchmark::State& state) {
 }
 BENCHMARK(readHeader);
 
-// The whole way from the bytes to the values, and the end of these.
+// Everything from the bytes to the values, including the destruction of the values.
 void readAndDecodeTenFields(benchmark::State& state) {
   const std::string bytes = sendMessageFrame(state.range(0) == 1);
   std::vector<Value> arguments;

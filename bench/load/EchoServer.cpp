@@ -49,7 +49,7 @@ void watch(int poller, int fd, int operation, std::uint32_t events) {
   epoll_ctl(poller, operation, fd, &event);
 }
 
-// False when the connection has ended.
+// Handles what has arrived. Returns false when the connection has ended.
 bool serve(int poller, int fd, sd_bus* bus) {
   int result = 0;
   while ((result = sd_bus_process(bus, nullptr)) > 0) {
@@ -84,8 +84,7 @@ int serveEcho(const std::string& socketPath) {
         if (accepted < 0) continue;
         connections[accepted] = makeBus(accepted);
         watch(poller, accepted, EPOLL_CTL_ADD, EPOLLIN);
-        // Starting the bus has read what the client sent first, so there is something to do
-        // already.
+        // sd_bus_start() has already read the client's first bytes, which epoll will not report.
         if (!serve(poller, accepted, connections.at(accepted).get())) connections.erase(accepted);
       } else if (!serve(poller, fd, connections.at(fd).get())) {
         connections.erase(fd);

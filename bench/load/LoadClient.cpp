@@ -42,7 +42,7 @@ int ignoreAnswer(sd_bus_message* /*message*/, void* /*userdata*/, sd_bus_error* 
   return 1;
 }
 
-// A mix of kinds as real messages have them: numbers, texts, a flag.
+// Adds fields of the kinds that real messages have: numbers, texts and flags.
 void appendField(sd_bus_message* message, int field, std::int64_t number, const std::string& text) {
   const std::string key = "field_number_" + std::to_string(field);
   int result = 0;
@@ -88,7 +88,8 @@ LoadClient::LoadClient(const std::string& socketPath, std::int64_t reporter, boo
   check(sd_bus_new(&bus_), "sd_bus_new");
   check(sd_bus_set_address(bus_, ("unix:path=" + socketPath).c_str()), "address");
   check(sd_bus_start(bus_), "connect");
-  // The echo's library overlooks a message that comes together with the end of the handshake.
+  // Complete the handshake first. sd-bus in the echo overlooks a message that arrives together with
+  // the end of the handshake.
   while (sd_bus_is_ready(bus_) == 0) {
     const int progress = sd_bus_process(bus_, nullptr);
     check(progress, "handshake");
@@ -96,7 +97,8 @@ LoadClient::LoadClient(const std::string& socketPath, std::int64_t reporter, boo
   }
   if (!withSession) return;
   call("createReportingSession", reporter);
-  // A start is answered at the stop; the next call's answer shows that it has been carried out.
+  // The service answers a start only at the stop. The answer to the next call shows that the
+  // session was started.
   Message start = newCall(bus_, "startReportingSessionForID");
   check(sd_bus_message_append(start.get(), "x", reporter), "append");
   check(sd_bus_call_async(bus_, nullptr, start.get(), ignoreAnswer, nullptr, UINT64_MAX), "start");
@@ -139,7 +141,7 @@ void LoadClient::pipeline(std::int64_t count, std::int64_t window, const Message
       sendOne(shape.content == Content::kDistinct ? sent : 0, shape);
       ++sent;
     }
-    // Half a window of answers at a time, so that both sides work in batches.
+    // Handle half a window of answers before sending again, so that both sides work in batches.
     int result = 0;
     while ((result = sd_bus_process(bus_, nullptr)) > 0 && sent - answered_ > window / 2) {
     }

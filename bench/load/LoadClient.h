@@ -11,32 +11,34 @@ namespace halvox::bench {
 
 enum class Content : std::uint8_t { kDistinct, kRepeated };
 
-// What is sent. A repeated message is the same each time, so a started session drops it as
-// redundant and its history does not grow.
+// The shape of the messages. A repeated message is the same each time: a started session drops it
+// as redundant, and its history does not grow.
 struct MessageShape {
   int fields = 10;
   int textBytes = 16;
   Content content = Content::kDistinct;
 };
 
-// One client on sd-bus: a connection with one started session. Belongs to one thread.
+// A client on sd-bus: a connection with at most one started session. Belongs to one thread. Throws
+// std::runtime_error on any failure.
 class LoadClient {
  public:
-  // Connects; when `withSession`, creates and starts a session of that identifier first.
+  // Connects and, if `withSession` is true, creates and starts a session with that identifier.
   LoadClient(const std::string& socketPath, std::int64_t reporter, bool withSession);
   ~LoadClient();
   LoadClient(const LoadClient&) = delete;
   LoadClient& operator=(const LoadClient&) = delete;
 
-  // Sends that many messages, never more than `window` unanswered, and waits for all answers.
+  // Sends `count` messages with at most `window` unanswered, and waits for all answers.
   void pipeline(std::int64_t count, std::int64_t window, const MessageShape& shape);
-  // Sends one message every millisecond, each after the answer to the last; seconds per answer.
+  // Sends one message a millisecond, each after the answer to the one before. Returns the time to
+  // each answer in seconds.
   std::vector<double> ping(int count, const MessageShape& shape);
-  // Asks something that looks nothing up in a long list; seconds to the answer.
+  // Sends a request that is cheap to answer. Returns the time to the answer in seconds.
   double ask();
-  // Stops its session.
+  // Stops the session and waits for the answer.
   void stop();
-  // Creates (and does not start) sessions from that identifier on.
+  // Creates `count` sessions with identifiers from `first` on, without starting them.
   void createSessions(std::int64_t first, std::int64_t count);
 
  private:

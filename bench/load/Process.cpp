@@ -76,7 +76,7 @@ void Process::waitForSocket(const std::string& path) const {
     if (::waitpid(pid_, nullptr, WNOHANG) == pid_) break;
     std::this_thread::sleep_for(milliseconds(10));
   }
-  throw std::runtime_error("nobody serves " + path);
+  throw std::runtime_error("the server does not accept connections on " + path);
 }
 
 nanoseconds Process::cpuTime() const {
@@ -130,7 +130,8 @@ long Process::sleeps() const {
 
 ScratchDirectory::ScratchDirectory() {
   std::string pattern = (std::filesystem::temp_directory_path() / "halvox-load-XXXXXX").string();
-  if (::mkdtemp(pattern.data()) == nullptr) throw std::runtime_error("no scratch directory");
+  if (::mkdtemp(pattern.data()) == nullptr)
+    throw std::runtime_error("cannot create a scratch directory");
   path_ = pattern;
 }
 

@@ -8,36 +8,38 @@
 
 namespace halvox::bench {
 
-// A server process under measurement. Started by the constructor, ended by the destructor.
+// A server process to measure. The constructor starts it, the destructor ends it and waits.
 class Process {
  public:
-  // Runs a program, by its path or as found in $PATH, with these arguments and additional
-  // environment ("NAME=value").
+  // Runs a program, given by its path or found in $PATH, with arguments and additional environment
+  // variables ("NAME=value"). Throws std::runtime_error when it cannot be started.
   Process(const std::vector<std::string>& command, const std::vector<std::string>& environment);
   ~Process();
   Process(const Process&) = delete;
   Process& operator=(const Process&) = delete;
 
-  // Waits until somebody serves the socket; throws when the process ends first.
+  // Waits until the socket accepts connections. Throws when the process ends before, or after ten
+  // seconds.
   void waitForSocket(const std::string& path) const;
-  // CPU time of all its threads so far.
+  // The CPU time of all threads so far.
   [[nodiscard]] std::chrono::nanoseconds cpuTime() const;
-  // CPU time once it has come to rest: what is still queued belongs to the work that was measured.
+  // Waits until the process uses no CPU for 100 ms and returns its CPU time. This includes work
+  // that was still queued, which belongs to what was measured.
   [[nodiscard]] std::chrono::nanoseconds settledCpuTime() const;
-  // Waits until it does next to nothing: less than a twentieth of what it could, for 200 ms.
+  // Waits until the process uses less than 5 % of one CPU for 200 ms.
   void waitForRest() const;
   [[nodiscard]] long residentKib() const;
-  // The most resident memory since the start, or since it was told to forget that.
+  // The peak resident memory since the start or the last forgetPeak().
   [[nodiscard]] long peakKib() const;
   void forgetPeak() const;
-  // How often its threads went to sleep so far; each time is one wake-up.
+  // How often threads of the process went to sleep so far. Each time is one wake-up.
   [[nodiscard]] long sleeps() const;
 
  private:
   pid_t pid_;
 };
 
-// A directory that goes with its object.
+// A temporary directory. The destructor deletes it with its content.
 class ScratchDirectory {
  public:
   ScratchDirectory();

@@ -6,13 +6,13 @@
 
 namespace halvox::bench {
 
-// One measured quantity; beside it, where it makes sense, the same of the echo in the same run.
+// One measured quantity of the service and, where it makes sense, that of the echo in the same run.
 struct Measurement {
   std::string name;
   std::string unit;
   double value = 0;
   std::optional<double> echo;
-  // The bound that the ratio (with an echo) or the value (without) is held to, and its direction.
+  // The bounds of the ratio (with an echo) or of the value (without).
   std::optional<double> atMost;
   std::optional<double> atLeast;
 
@@ -21,7 +21,7 @@ struct Measurement {
   [[nodiscard]] bool holds() const;
 };
 
-// All measurements as a table for people, and as JSON.
+// Formats the measurements as a table for people, and as JSON.
 std::string formatTable(const std::vector<Measurement>& measurements);
 std::string formatJson(const std::vector<Measurement>& measurements);
 

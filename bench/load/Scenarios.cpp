@@ -30,7 +30,8 @@ struct Cost {
   double clientMicros;
 };
 
-// What `count` messages of one pipelining client cost, the server's later work included.
+// Measures `count` messages of one pipelining client, including the server's work after the last
+// answer.
 Cost pipelineCost(const Server& server, LoadClient& client, const LoadOptions& options,
                   std::int64_t count) {
   const auto serverBefore = server.process().settledCpuTime();
@@ -47,7 +48,7 @@ Cost pipelineCost(const Server& server, LoadClient& client, const LoadOptions& o
 Cost oneRun(const LoadOptions& options, ServerKind kind, const char* link = kNoLink) {
   const Server server(options.programs, kind, link);
   const auto client = server.client(1);
-  client->pipeline(5000, options.window, options.shape);  // warm caches and pools
+  client->pipeline(5000, options.window, options.shape);  // warms caches and pools up
   return pipelineCost(server, *client, options, options.messages);
 }
 
@@ -57,7 +58,7 @@ double medianOf(const std::vector<Cost>& costs, double Cost::*member) {
   return median(values);
 }
 
-// Pings while other clients keep the server busy.
+// Measures the latency of one client while others keep the server busy.
 std::vector<double> pingUnderLoad(const Server& server, const LoadOptions& options, int count) {
   std::atomic<bool> stopping{false};
   std::vector<std::thread> busy;
@@ -147,8 +148,8 @@ void measureMemory(const LoadOptions& options, std::vector<Measurement>& results
     std::vector<std::thread> busy;
     for (int number = 0; number < options.clients; ++number) {
       busy.emplace_back([&, number] {
-        // Repeated messages are recorded by the store but not in the session's history, whose
-        // memory is measured below.
+        // Repeat one message: the store records it, but the session's history does not grow. The
+        // memory of the history is measured below.
         MessageShape repeated = options.shape;
         repeated.content = Content::kRepeated;
         server.client(1 + number)->pipeline(options.messages / 2, options.window, repeated);

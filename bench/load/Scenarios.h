@@ -13,12 +13,13 @@ struct LoadOptions {
   ServerPrograms programs;
   std::int64_t messages = 200'000;
   std::int64_t window = 64;
-  int clients = 4;  // for memory and latency under load
-  int rounds = 3;   // throughput is measured so often, echo and service in turn
+  int clients = 4;  // the number of clients for memory and latency under load
+  int rounds = 3;   // of throughput; in each round echo and service take turns
   MessageShape shape;
 };
 
-// Each runs servers of its own, appends what it measured and leaves nothing running.
+// Each scenario starts its own servers, appends its measurements and ends the servers. Throws
+// std::runtime_error when a server cannot be started or reached.
 void measureThroughput(const LoadOptions& options, std::vector<Measurement>& results);
 void measureLatency(const LoadOptions& options, std::vector<Measurement>& results);
 void measureMemory(const LoadOptions& options, std::vector<Measurement>& results);

@@ -9,7 +9,8 @@
 
 namespace halvox::bench {
 
-// The echo, the service with both events of each message stored, the service with none wanted.
+// The echo; the service, which stores both events of each message; the service without any wanted
+// event.
 enum class ServerKind : std::uint8_t { kEcho, kStored, kUnwanted };
 
 inline constexpr const char* kNoLink = "[link]\nbackend = \"none\"\n";
@@ -20,14 +21,13 @@ struct ServerPrograms {
   std::string echo;  // takes "--echo SOCKET"
 };
 
-// A server of some kind with a directory of its own, which goes with it.
+// Runs a server with its own directory, and deletes the directory afterwards.
 class Server {
  public:
-  // `settings` are tables that are added to the configuration, that of the link among them.
-  // them.
+  // `settings` is TOML text that is added to the configuration, with the table of the link.
   Server(const ServerPrograms& programs, ServerKind kind, const std::string& settings = kNoLink);
 
-  // A client with a started session, and one without any.
+  // Returns a client with a started session, or one without a session.
   [[nodiscard]] std::unique_ptr<LoadClient> client(std::int64_t reporter) const;
   [[nodiscard]] std::unique_ptr<LoadClient> idleClient() const;
   [[nodiscard]] const Process& process() const { return *process_; }

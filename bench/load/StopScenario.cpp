@@ -8,7 +8,7 @@
 
 #include "bench/load/Scenarios.h"
 
-// What the stop of a session with a long history costs the service, its client and the others.
+// The cost of stopping a session with a long history: for the service, its client and others.
 namespace halvox::bench {
 namespace {
 
@@ -21,7 +21,8 @@ double secondsSince(Clock::time_point begin) {
   return std::chrono::duration<double>(Clock::now() - begin).count();
 }
 
-// A client that asks every 10 ms, also when an answer took longer, from its making to stop().
+// A client that sends a request every 10 ms, or after each answer if that takes longer, from its
+// construction to end().
 class OtherClient {
  public:
   explicit OtherClient(const Server& server)
@@ -30,7 +31,7 @@ class OtherClient {
   OtherClient(const OtherClient&) = delete;
   OtherClient& operator=(const OtherClient&) = delete;
 
-  // The seconds that each answer took.
+  // Stops sending. Returns the time to each answer in seconds.
   std::vector<double> end() {
     ending_ = true;
     if (thread_.joinable()) thread_.join();
@@ -48,8 +49,8 @@ class OtherClient {
   }
 
   std::unique_ptr<LoadClient> client_;
-  std::vector<double> waits_;        // of the thread until it has ended
-  std::atomic<bool> ending_{false};  // orders with nothing: the thread is joined
+  std::vector<double> waits_;        // written by the thread; read after it was joined
+  std::atomic<bool> ending_{false};  // orders with nothing: join() does
   std::thread thread_;
 };
 

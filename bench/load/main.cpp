@@ -47,13 +47,13 @@ int run(int argc, char** argv) {
   app.add_option("--messages", options.messages, "Messages per run")
       ->capture_default_str()
       ->check(CLI::PositiveNumber);
-  app.add_option("--window", options.window, "Unanswered messages at a time")
+  app.add_option("--window", options.window, "Most unanswered messages at a time")
       ->capture_default_str()
       ->check(CLI::PositiveNumber);
-  app.add_option("--clients", options.clients, "Clients at a time for memory and load")
+  app.add_option("--clients", options.clients, "Clients for memory and for latency under load")
       ->capture_default_str()
       ->check(CLI::PositiveNumber);
-  app.add_option("--rounds", options.rounds, "Rounds of throughput; the median counts")
+  app.add_option("--rounds", options.rounds, "Rounds of throughput; the result is the median")
       ->capture_default_str()
       ->check(CLI::PositiveNumber);
   app.add_option("--fields", options.shape.fields, "Fields per message")
@@ -63,7 +63,7 @@ int run(int argc, char** argv) {
       ->capture_default_str()
       ->check(CLI::Range(0, 1'000'000));
   app.add_option("--json", json, "Also write the results to this file");
-  app.add_option("--echo", echoSocket, "Be the echo server on this socket")->group("");
+  app.add_option("--echo", echoSocket, "Run as the echo server on this socket")->group("");
   CLI11_PARSE(app, argc, argv);
   if (!echoSocket.empty()) return halvox::bench::serveEcho(echoSocket);
 

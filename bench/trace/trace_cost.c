@@ -1,14 +1,14 @@
-/* What a trace point costs whoever emits it, beside a tracepoint of LTTng with nothing around it.
+/* The cost of a trace point for the program that emits it, compared with a bare LTTng tracepoint.
  *
  *   halvox_trace_cost BURSTS EVENTS
  *
- * Two shapes of both: in a loop, where the compiler looks the trace's state up once, and alone in a
- * function, where it must do so at each call, which is then in the time too. All take turns in
- * short bursts, so that the tracer's buffers never fill and whatever else the machine does meets
- * all of them. Told are nanoseconds an event: the median of the bursts, and the least. The code is
- * position independent, as in the library of an audio framework, and laid out alike: see
- * CMakeLists.txt. trace_cost.py runs it without a tracer and with one that records as the service
- * does. */
+ * Measures both in two shapes. In a loop, the code loads the address of the trace's state once.
+ * Alone in a function, it does so at each call, and the call and the return are in the time too.
+ * All four variants take turns in short bursts, so that the tracer's buffers never fill and other
+ * work on the machine affects all alike. Prints nanoseconds an event: the median and the minimum of
+ * the bursts. The code is position independent, as in the library of an audio framework, and has
+ * the same layout in all variants: see CMakeLists.txt. trace_cost.py runs this without a tracer,
+ * and with one that records as the service does. */
 
 #define LTTNG_UST_TRACEPOINT_CREATE_PROBES
 #define LTTNG_UST_TRACEPOINT_DEFINE
@@ -21,7 +21,7 @@
 #include "client/halvox_trace.h"
 
 #define ALIKE __attribute__((noinline, aligned(64)))
-/* An emitter does other things between two of them. */
+/* Keeps the compiler from merging two trace points; a real program does other work between them. */
 #define OTHER_THINGS __asm__ volatile("" ::: "memory")
 
 enum { kShapes = 4 };
@@ -72,7 +72,7 @@ static int compare(const void* left, const void* right) {
   return (difference > 0) - (difference < 0);
 }
 
-/* Sorts both. */
+/* Prints the medians and the minima. Sorts both arrays. */
 static void tell(const char* shape, double* ours, double* bare, size_t bursts) {
   qsort(ours, bursts, sizeof *ours, compare);
   qsort(bare, bursts, sizeof *bare, compare);
@@ -94,7 +94,7 @@ int main(int count, char** arguments) {
                                   calloc(bursts, sizeof(double)), calloc(bursts, sizeof(double))};
   const struct timespec pause = {0, 5 * 1000 * 1000};
   for (size_t round = 0; round < bursts; ++round) {
-    /* The first one after a pause meets cold caches, so each goes first in its turn. */
+    /* The first variant after a pause has cold caches, so each round starts with another one. */
     for (size_t turn = 0; turn < kShapes; ++turn) {
       const size_t shape = (round + turn) % kShapes;
       times[shape][round] = burst(runs[shape], events);

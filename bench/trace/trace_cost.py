@@ -1,6 +1,6 @@
-"""Runs halvox_trace_cost without a tracer and with one that records as the service does.
+"""Runs halvox_trace_cost without a tracer, then with one that records as the service does.
 
-The tracer is a private one of an unprivileged user. HALVOX_BIN names the directory of programs.
+Starts a private tracer as an unprivileged user. HALVOX_BIN names the directory of the programs.
 """
 
 import os
