@@ -39,15 +39,16 @@ std::string_view HVReportingUtilityTypeString(std::uint32_t type);
 // Returns the name of a service. Lives as long as the process. Unlisted values are "telephony",
 // which is deliberate.
 std::string_view HVReportingUtilityGenerateServiceNameFromServiceType(AudioServiceType serviceType);
-// Returns the service of a name, which is case-sensitive; kUnknown for any other text or none.
+// Returns the service with exactly that name; kUnknown for any other text and for none.
 AudioServiceType HVReportingUtilityGenerateServiceTypeFromServiceName(
     std::optional<std::string_view> serviceName);
 
 // --- Decisions ----------------------------------------------------------------------------------
 
-// Returns whether messages are sent at all. Always true; callers ask all the same.
+// Returns whether messages are sent at all. Always true, but callers are required to ask.
 bool HVReportingUtilityShouldSendMessage();
-// Returns whether sessions may send through an open link. Always true; callers ask all the same.
+// Returns whether sessions may send through an open link. Always true, but callers are required to
+// ask.
 bool HVReportingUtilityAllowSessionTransactions();
 // Returns whether the link may batch the messages of a service: all services but kAPIUsage.
 bool HVReportingUtilityShouldBatchTLMReportingEventsForServiceType(AudioServiceType serviceType);
@@ -81,8 +82,8 @@ bool HVReportingUtilityIsInternalBuild();
 // Reads the platform's record of a process into `record`. Returns false, and does not change
 // `record`, when there is no such process.
 bool HVReportingUtilityProcessInfoForPID(platform::ProcessID pid, platform::ProcessRecord& record);
-// Returns the command name of a process, or the own name of this process; std::nullopt when there
-// is no such process.
+// Returns the command name of a process, or this process's own name; std::nullopt when there is no
+// such process.
 std::optional<std::string> HVReportingUtilityProcessNameForPID(platform::ProcessID pid);
 
 // --- Messages -----------------------------------------------------------------------------------

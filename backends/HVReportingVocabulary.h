@@ -11,11 +11,11 @@ namespace halvox {
 
 // The identifier that a client chose for its session.
 enum class ReporterID : std::int64_t {};
-// Not the identifier of any session.
+// Identifies no session.
 inline constexpr ReporterID kNoReporterID{0};
 
 // What a message is about. The low 16 bits are the category proper. The high 16 bits may have one
-// domain, combined by `|`. Clients may send any value, also one that is not listed.
+// domain, combined by `|`. Clients may send any value, including unlisted ones.
 enum class AudioEventCategory : std::uint32_t {
   kUndefined = 0,
   kGeneric = 1,
@@ -47,7 +47,7 @@ constexpr AudioEventCategory operator|(AudioEventCategory left, AudioEventCatego
                                          static_cast<std::uint32_t>(right));
 }
 
-// What happened. Clients may send any value, also one that is not listed.
+// What happened. Clients may send any value, including unlisted ones.
 enum class AudioEventType : std::uint16_t {
   kStart = 1,
   kStop = 2,
@@ -70,7 +70,7 @@ enum class AudioEventType : std::uint16_t {
   kUnknown = 65535,
 };
 
-// The kind of audio of a session. Clients may send any value, also one that is not listed.
+// The kind of audio of a session. Clients may send any value, including unlisted ones.
 enum class AudioServiceType : std::uint16_t {
   kGeneric = 0,
   kQuillo = 1,

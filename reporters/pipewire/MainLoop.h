@@ -10,7 +10,8 @@ namespace halvox::pipewire_reporter {
 // The event loop of the reporter. Handles PipeWire's events, SIGTERM and SIGINT, and calls that
 // other threads request; sleeps between them without a timer.
 // Make one in a process, and make it before any other thread. The constructor blocks the two
-// signals, and threads inherit that; a thread made earlier would still be ended by them.
+// signals, and later threads inherit that. The kernel may deliver a signal to an earlier thread,
+// and the process would end without stopping its sessions.
 class MainLoop {
  public:
   // Throws std::runtime_error when the loop cannot be made, for example without free descriptors.

@@ -309,7 +309,7 @@ void PipeWireSource::Impl::onCoreError(void* data, std::uint32_t id, int /*seque
     }
     return;
   }
-  self->options_.log("PipeWire has disconnected; its sessions end, and connecting is tried again");
+  self->options_.log("PipeWire has disconnected; ending its sessions and trying to reconnect");
   // Let the timer close the connection: the library does not allow that in its own callback.
   self->retryAfter(kReconnectSoon);
 }

@@ -22,7 +22,7 @@ namespace halvox::platform::linux_ {
 struct SnapshotRequest {
   Date time;
   Dictionary signature;
-  double durationSeconds = 0;  // only noted: a snapshot shows one moment
+  double durationSeconds = 0;  // recorded only: a snapshot shows one moment
   std::optional<Dictionary> event{};
   std::optional<Dictionary> payload{};
 };
@@ -46,8 +46,8 @@ class SnapshotCollector {
   SnapshotCollector(const SnapshotRequest& request, const SnapshotSources& sources,
                     SnapshotArchive& archive, const Deadline& deadline);
 
-  // Collects all parts; call it once. Blocks until the deadline at most. Returns an error when the
-  // archive cannot be written or the service is ending.
+  // Collects all parts; call it once. Collects until the deadline at most, but may block longer on
+  // the disk. Returns an error when the archive cannot be written or the service is ending.
   [[nodiscard]] std::optional<std::string> collect();
 
  private:

@@ -58,7 +58,8 @@ bool isSnapshotName(std::string_view name) {
 int renameToFree(const fs::path& from, const fs::path& to) {
   if (::renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0) return 0;
   if (errno != EINVAL && errno != ENOSYS) return errno;
-  // This file system cannot rename so. Testing first is safe enough: no other program writes here.
+  // The file system does not support this flag. Testing first is safe, because no other program
+  // writes here.
   if (::access(to.c_str(), F_OK) == 0) return EEXIST;
   return ::rename(from.c_str(), to.c_str()) == 0 ? 0 : errno;
 }

@@ -75,7 +75,7 @@ class Walk {
     if (result == ARCHIVE_EOF) return nullptr;
     if (result != ARCHIVE_OK) return failed(snapshot_, textOf(reader_.get()));
     if (++entries_ > kMostEntries) return failed(snapshot_, "the archive has too many files");
-    // Skipping an entry decompresses it. Reject by the sizes in the headers, before that.
+    // Skipping an entry decompresses it too. Test the sizes in the headers before that.
     announced_ += std::min(static_cast<std::uint64_t>(archive_entry_size(entry)), kMostBytes + 1);
     if (announced_ > kMostBytes) return failed(snapshot_, kTooLarge);
     const char* name = archive_entry_pathname(entry);
@@ -156,7 +156,7 @@ class WorkingDirectory {
   const int error_;
 };
 
-// Looks at all entries, so that an archive with a bad one leaves nothing behind.
+// Validates all entries before anything is unpacked, so that a bad archive leaves nothing behind.
 Failure check(const fs::path& snapshot, const fs::path& directory, ExistingFiles existing) {
   return forEachEntry(snapshot, [&](Walk&, archive_entry* entry) -> Failure {
     struct stat status {};

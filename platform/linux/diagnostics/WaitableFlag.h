@@ -9,8 +9,8 @@ namespace halvox::platform::linux_ {
 
 // A flag that is raised once and stays raised, such as the request to stop. A working thread can
 // test it, and can wait for it together with other descriptors. Any thread may raise or test it.
-// Without a free descriptor it works as a plain flag, and waiting threads notice it when their own
-// wait ends.
+// If the process has no free descriptor, waiting threads notice the flag only when their own
+// time-out ends.
 class WaitableFlag {
  public:
   WaitableFlag();

@@ -58,8 +58,8 @@ std::error_code DirectoryWatch::add(const std::filesystem::path& path, std::uint
   return {};
 }
 
-// Watches every directory from the root to the wanted one: the wanted one for changes of its files,
-// the others only for being moved or deleted. Where the path ends, waits for the next name.
+// Watches every directory from the root to the wanted one. Watches the last one for changes of its
+// files, the others only for being moved or deleted. Where the path ends, waits for the next name.
 std::error_code DirectoryWatch::watchWay(std::size_t directory) {
   const std::filesystem::path& target = directories_[directory];
   std::filesystem::path path;
