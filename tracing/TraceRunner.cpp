@@ -32,7 +32,9 @@ constexpr std::size_t kExpectedEvents = 10'000;
 
 TraceRunner::TraceRunner()
     : queue_(platform::dispatch().createSerialQueue(
-          kQueueLabel, platform::QualityOfService::kUtility, platform::QueueThreading::kOwnThread)),
+          // A stop waits for it on the reporting queue, so it must not run after what gives way.
+          kQueueLabel, platform::QualityOfService::kUserInteractive,
+          platform::QueueThreading::kOwnThread)),
       completion_(platform::dispatch().createSemaphore(0)) {}
 
 // A runner can go while it records, when its session is replaced by another without a stop. What

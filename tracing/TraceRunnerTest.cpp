@@ -84,7 +84,7 @@ TEST_F(TraceRunnerTest, TracesRunOnAQueueOfTheirOwnWithAThreadOfItsOwn) {
   const auto queues = platform_.dispatch.createdQueues();
   ASSERT_EQ(queues.size(), 1U);
   EXPECT_EQ(queues[0].label, "Tracing Queue");
-  EXPECT_EQ(queues[0].quality, platform::QualityOfService::kUtility);
+  EXPECT_EQ(queues[0].quality, platform::QualityOfService::kUserInteractive);
   EXPECT_EQ(queues[0].threading, platform::QueueThreading::kOwnThread);
 
   add(params("Startup"));

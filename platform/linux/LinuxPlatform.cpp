@@ -13,6 +13,8 @@ namespace {
 
 // How long the end of the service waits for jobs that run.
 constexpr std::chrono::seconds kJobsEndWithin{5};
+// How long it lets the queues of sessions run what they have before that.
+constexpr std::chrono::seconds kQueuesFinishWithin{5};
 
 LogCategory& mainCategory() {
   static LogCategory& category = platform::log().createCategory("com.tarno.halvox", "main");
@@ -217,6 +219,9 @@ bool LinuxPlatform::close() {
   diagnosticReporters_.stop();
   notify_.stop();  // it adds jobs to queues
   traces_->stop();
+  // What sessions were sent is to reach the link; its queues give way to all else, so they may be
+  // behind.
+  dispatch_.finish(kQueuesFinishWithin);
   const bool ended = dispatch_.stop(kJobsEndWithin);
   ended ? traces_->close() : traces_->abandon();
   linkCallbacks_.stop();

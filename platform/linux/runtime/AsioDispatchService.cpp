@@ -1,5 +1,7 @@
 #include "platform/linux/runtime/AsioDispatchService.h"
 
+#include <algorithm>
+#include <iterator>
 #include <string>
 #include <system_error>
 #include <utility>
@@ -15,7 +17,7 @@ namespace halvox::platform::linux_ {
 AsioDispatchService::AsioDispatchService(LogService& log, StatisticsService& statistics)
     : log_(log.createCategory("com.tarno.halvox", "dispatch")),
       runner_(std::make_shared<JobRunner>(log, statistics)),
-      pool_(std::make_shared<DispatchPool>(runner_)) {}
+      pool_(std::make_shared<DispatchPool>(runner_, statistics)) {}
 
 AsioDispatchService::~AsioDispatchService() { stop(std::chrono::hours(24 * 365)); }
 
@@ -25,7 +27,7 @@ std::shared_ptr<DispatchQueue> AsioDispatchService::createSerialQueue(std::strin
   if (threading == QueueThreading::kOwnThread) {
     if (auto queue = createOwnThreadQueue(label, quality)) return queue;
   }
-  return std::make_shared<SharedQueue>(pool_);
+  return std::make_shared<SharedQueue>(pool_, label, quality);
 }
 
 std::shared_ptr<DispatchSemaphore> AsioDispatchService::createSemaphore(std::uint64_t signals) {
@@ -33,7 +35,7 @@ std::shared_ptr<DispatchSemaphore> AsioDispatchService::createSemaphore(std::uin
 }
 
 void AsioDispatchService::asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) {
-  pool_->delayedJobs().add(delay, std::move(job));
+  pool_->delayedJobs().add(delay, QualityOfService::kBackground, std::move(job));
 }
 
 void AsioDispatchService::beginHelping() { HelpingThread::current().begin(); }
@@ -43,6 +45,11 @@ void AsioDispatchService::endHelping() { HelpingThread::current().end(); }
 void AsioDispatchService::holdPool() { BatchedTurns::current().begin(); }
 
 void AsioDispatchService::wakePool() { BatchedTurns::current().end(); }
+
+void AsioDispatchService::finish(std::chrono::milliseconds limit) {
+  wakePool();  // what this thread still holds back
+  pool_->waitUntilIdle(std::chrono::steady_clock::now() + limit);
+}
 
 bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
   const auto deadline = std::chrono::steady_clock::now() + limit;
@@ -54,14 +61,27 @@ bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
   }
   for (const auto& queue : queues) queue->stop();
   pool_->stop();
+  std::vector<std::string> stuck;
   for (const auto& queue : queues) {
-    if (!queue->waitForEnd(deadline)) return false;
+    if (!queue->waitForEnd(deadline)) stuck.push_back(queue->label());
   }
-  if (!pool_->waitForEnd(deadline)) return false;
+  const bool hasPoolEnded = pool_->waitForEnd(deadline);
+  if (!hasPoolEnded || !stuck.empty()) {
+    std::ranges::move(pool_->labels().atWork(), std::back_inserter(stuck));
+    logStuck(stuck);
+    return false;
+  }
   pool_->discardJobs();
   const MutexLock lock(mutex_);
   ownThreadQueues_.clear();
   return true;
+}
+
+void AsioDispatchService::logStuck(const std::vector<std::string>& labels) {
+  std::string text = "jobs have not ended in time and are left behind, of the queues:";
+  for (const std::string& label : labels) text += " \"" + label + "\"";
+  if (labels.empty()) text += " the background queue";
+  log_.write(LogLevel::kError, detail::logPrefix("AsioDispatchService", __LINE__) + text);
 }
 
 // None when the system has no thread to give or the service has stopped: the caller's jobs then run

@@ -3,6 +3,7 @@
 #include <chrono>
 #include <cstdint>
 #include <memory>
+#include <string>
 #include <string_view>
 #include <vector>
 
@@ -20,6 +21,12 @@ class OwnThreadQueue;
 // Queues over threads of their own and over a small pool (Asio). Nothing runs while nothing is to
 // be done. A job that throws is logged and counted; its queue goes on. A shared queue that waits on
 // a semaphore costs memory only.
+//
+// Quality of service: threads for utility and background work run at a lower scheduling priority,
+// each for good, so the pool has threads of its own for each quality, made when first needed. What
+// requests wait for must not be of a lower quality than theirs. Labels name own threads, and count
+// the jobs of shared queues: a queue that is stuck has more jobs added than run, and is named in
+// the log when it keeps the service from ending.
 //
 // Helping: a thread that hands a batch of requests to a queue puts them between beginHelping() and
 // endHelping(). Brief jobs that it adds to a queue with an own thread then wake nobody; at the end
@@ -50,6 +57,9 @@ class AsioDispatchService final : public DispatchService {
   void holdPool();
   void wakePool();
 
+  // Lets the shared queues run what they have, for `limit` at most; for an end that loses nothing.
+  // Queues that wait and jobs whose time has not come are not waited for. Not from a job.
+  void finish(std::chrono::milliseconds limit);
   // Ends all threads: the jobs that run end, those that wait, those of waiting queues and those to
   // come are discarded and counted. Waits for `limit` at most; false when a job still runs then,
   // and the process should end without destroying this. May be called again; not from a job.
@@ -58,6 +68,7 @@ class AsioDispatchService final : public DispatchService {
  private:
   std::shared_ptr<DispatchQueue> createOwnThreadQueue(std::string_view label,
                                                       QualityOfService quality);
+  void logStuck(const std::vector<std::string>& labels);
 
   LogCategory& log_;
   const std::shared_ptr<JobRunner> runner_;

@@ -270,7 +270,7 @@ class AsioDispatchWaitTest : public AsioDispatchServiceTest {
       std::ifstream status(task.path() / "status");
       std::string line;
       std::getline(status, line);
-      if (line != "Name:\tpool") continue;
+      if (!line.starts_with("Name:\tpool-")) continue;
       while (std::getline(status, line)) {
         const std::size_t name = line.find("ctxt_switches:");
         if (name != std::string::npos) sum += std::stoull(line.substr(line.find(':') + 1));
@@ -297,6 +297,25 @@ TEST_F(AsioDispatchWaitTest, ThousandWaitingQueuesCostNoThreadAndNoWakeUps) {
     return wakeUps() == start;
   }));
   EXPECT_EQ(ended_, 0);
+}
+
+TEST_F(AsioDispatchWaitTest, AWaitThatEndedWakesNobodyWhenItsTimeOutWouldHaveCome) {
+  constexpr std::chrono::milliseconds kTimeOut{1500};
+  const auto begun = std::chrono::steady_clock::now();
+  letQueuesWait(*service_, 3, kTimeOut);
+  for (int signal = 0; signal < 3; ++signal) semaphore_->signal();
+  ASSERT_TRUE(waitFor([&] { return ended_ == 3; }));
+  std::uint64_t settled = 0;
+  ASSERT_TRUE(waitFor([&] {
+    const std::uint64_t last = std::exchange(settled, wakeUps());
+    std::this_thread::sleep_for(std::chrono::milliseconds(100));
+    return settled == last;
+  }));
+  if (std::chrono::steady_clock::now() > begun + kTimeOut) GTEST_SKIP() << "too busy to measure";
+
+  std::this_thread::sleep_until(begun + 2 * kTimeOut);  // the quantity measured
+
+  EXPECT_EQ(wakeUps(), settled);
 }
 
 TEST_F(AsioDispatchWaitTest, StopDropsWaitsWithTheJobsBehindThemAndCountsThem) {

@@ -1,62 +1,79 @@
 #pragma once
 
-#include <array>
 #include <atomic>
 #include <chrono>
+#include <cstdint>
 #include <memory>
-#include <thread>
 
-#include <asio/executor_work_guard.hpp>
 #include <asio/io_context.hpp>
 
+#include "platform/dispatch.h"
 #include "platform/linux/Mutex.h"
 #include "platform/linux/runtime/DelayedJobs.h"
 #include "platform/linux/runtime/DispatchWaits.h"
 #include "platform/linux/runtime/JobRunner.h"
+#include "platform/linux/runtime/PoolThreads.h"
+#include "platform/linux/runtime/QueueLabels.h"
 
 namespace halvox::platform::linux_ {
 
-// The threads that all shared queues and delayed jobs run on. Two of them, so that one job that
-// waits does not hold up all others.
+// What all shared queues and delayed jobs run on: threads for each quality of service. Those for
+// utility work are there from the beginning, the others are made when there is a job for them.
+// Where the system has no more threads to give, the utility threads do the others' work.
 // Shared by the service, the shared queues and the semaphores; the service stops it.
 class DispatchPool {
  public:
-  // Throws std::system_error when the system has no threads to give.
-  explicit DispatchPool(std::shared_ptr<JobRunner> runner);
+  // Throws std::system_error when the system has no threads to give. `statistics` must outlive it.
+  DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService& statistics);
+  DispatchPool(const DispatchPool&) = delete;
+  DispatchPool& operator=(const DispatchPool&) = delete;
   // Waits for the jobs that run.
   ~DispatchPool();
 
-  [[nodiscard]] asio::io_context& context() { return context_; }
+  // What the threads of that quality run. The jobs that it is given must see for themselves whether
+  // the pool has stopped.
+  [[nodiscard]] asio::io_context& context(QualityOfService quality);
   [[nodiscard]] JobRunner& runner() { return *runner_; }
+  [[nodiscard]] QueueLabels& labels() { return labels_; }
   [[nodiscard]] DelayedJobs& delayedJobs() { return delayedJobs_; }
   [[nodiscard]] DispatchWaits& waits() { return waits_; }
   // Orders with nothing: jobs that are added during the stop may go either way.
   [[nodiscard]] bool isStopped() const { return isStopped_.load(std::memory_order_relaxed); }
 
+  // Each turn of a queue is told of: when one is to come, and when the queue has nothing left to
+  // run.
+  void beginTurn() { turns_.fetch_add(1); }
+  void endTurn() {
+    if (turns_.fetch_sub(1) == 1 && isAwaited_.load()) tellIdle();
+  }
+  // Waits until no queue has a job that may run now, at most until that time. Queues that wait on
+  // semaphores and jobs whose time has not come are not waited for.
+  void waitUntilIdle(std::chrono::steady_clock::time_point deadline);
+
   // Lets the threads end after the jobs that run; discards all others, and ends no wait any more.
   void stop();
   // Waits for their end until that time; false when a job still runs then. After stop() only.
   bool waitForEnd(std::chrono::steady_clock::time_point deadline);
-  // Destroys the discarded jobs and waits, which may hold the queues that hold the pool. After a
-  // wait that gave true only.
+  // Destroys the discarded jobs and waits, which may hold the queues that hold the pool. Call only
+  // after waitForEnd() has returned true.
   void discardJobs();
 
  private:
-  static constexpr std::size_t kThreads = 2;
-
-  void run();
-  void end();
+  void tellIdle() HALVOX_EXCLUDES(mutex_);
 
   const std::shared_ptr<JobRunner> runner_;
-  std::atomic<bool> isStopped_{false};
-  asio::io_context context_{static_cast<int>(kThreads)};
-  asio::executor_work_guard<asio::io_context::executor_type> work_{context_.get_executor()};
-  DelayedJobs delayedJobs_{context_, *runner_};
-  DispatchWaits waits_{delayedJobs_, *runner_};
+  QueueLabels labels_;
+  // Ordered with each other, so that the end of the last turn cannot miss whoever begins to wait.
+  std::atomic<std::int64_t> turns_{0};
+  std::atomic<bool> isAwaited_{false};
   Mutex mutex_;
-  Condition ended_;
-  std::size_t running_ HALVOX_GUARDED_BY(mutex_) = kThreads;
-  std::array<std::thread, kThreads> threads_;  // last: they use all of the above
+  Condition idle_;
+  std::atomic<bool> isStopped_{false};
+  PoolThreads urgent_{QualityOfService::kUserInteractive};
+  PoolThreads utility_{QualityOfService::kUtility};
+  PoolThreads background_{QualityOfService::kBackground};
+  DelayedJobs delayedJobs_{*this};
+  DispatchWaits waits_{delayedJobs_, *runner_};
 };
 
 }  // namespace halvox::platform::linux_

@@ -37,8 +37,10 @@ std::optional<WaitOutcome> DispatchWaits::tryEnd(const std::shared_ptr<SharedSem
   if (!isStopped_ && timeout.has_value() && timeout->count() <= 0) return WaitOutcome::kTimedOut;
   const std::uint64_t number = begun_++;
   if (!isStopped_ && timeout.has_value()) {
-    wait.timeout = delayedJobs_.add(*timeout, [this, weakSemaphore = std::weak_ptr(semaphore),
-                                               number] { timeOut(weakSemaphore, number); });
+    wait.timeout = delayedJobs_.add(*timeout, QualityOfService::kUtility,
+                                    [this, weakSemaphore = std::weak_ptr(semaphore), number] {
+                                      timeOut(weakSemaphore, number);
+                                    });
   }
   semaphore->waits_.emplace(number, std::move(wait));
   semaphores_.insert(semaphore);

@@ -20,8 +20,9 @@ void JobRunner::reportFailure() noexcept {
   } catch (...) {
     // Nothing more is known about it.
   }
-  log_.write(LogLevel::kError,
-             detail::logPrefix("JobRunner", __LINE__) + "a job failed with an exception: " + what);
+  log_.write(LogLevel::kError, detail::logPrefix("JobRunner", __LINE__) + "a job of queue \"" +
+                                   std::string(currentLabel_) +
+                                   "\" failed with an exception, the queue goes on: " + what);
 }
 
 }  // namespace halvox::platform::linux_

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <string_view>
+
 #include "platform/dispatch.h"
 #include "platform/log.h"
 #include "platform/statistics.h"
@@ -13,16 +15,25 @@ class JobRunner {
   // Both services must outlive the runner.
   JobRunner(LogService& log, StatisticsService& statistics);
 
-  // Marks the calling thread as working for `queue` (null: for none) for a scope; nests.
+  // Marks the calling thread as working for `queue` (null: for none) for a scope; nests. The label,
+  // which the caller keeps, is for the log.
   class Scope {
    public:
-    explicit Scope(const DispatchQueue* queue) : outer_(current_) { current_ = queue; }
-    ~Scope() { current_ = outer_; }
+    Scope(const DispatchQueue* queue, std::string_view label)
+        : outer_(current_), outerLabel_(currentLabel_) {
+      current_ = queue;
+      currentLabel_ = label;
+    }
+    ~Scope() {
+      current_ = outer_;
+      currentLabel_ = outerLabel_;
+    }
     Scope(const Scope&) = delete;
     Scope& operator=(const Scope&) = delete;
 
    private:
     const DispatchQueue* outer_;
+    std::string_view outerLabel_;  // owned as the queue's label is
   };
   [[nodiscard]] static bool isCurrent(const DispatchQueue* queue) { return current_ == queue; }
 
@@ -40,6 +51,7 @@ class JobRunner {
   void reportFailure() noexcept;
 
   static inline thread_local const DispatchQueue* current_ = nullptr;
+  static inline thread_local std::string_view currentLabel_;  // owned by whoever has the scope
 
   LogCategory& log_;
   Counter& failed_;

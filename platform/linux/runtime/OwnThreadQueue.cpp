@@ -2,9 +2,6 @@
 
 #include <stdexcept>
 
-#include <sys/resource.h>
-#include <unistd.h>
-
 #include "platform/linux/runtime/BatchedTurns.h"
 #include "platform/linux/runtime/ThreadSetup.h"
 
@@ -15,7 +12,6 @@ namespace {
 constexpr std::size_t kHelpedJobsLimit = 1000;
 // Room for jobs that a queue keeps when it has nothing to do.
 constexpr std::size_t kKeptCapacity = 4096;
-constexpr int kBackgroundNiceness = 10;
 
 }  // namespace
 
@@ -99,11 +95,8 @@ bool OwnThreadQueue::waitForEnd(std::chrono::steady_clock::time_point deadline) 
 }
 
 void OwnThreadQueue::run() {
-  setUpThread(label_);
-  if (quality_ == QualityOfService::kBackground) {
-    ::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), kBackgroundNiceness);
-  }
-  const JobRunner::Scope scope(this);
+  setUpThread(label_, quality_);
+  const JobRunner::Scope scope(this, label_);
   work();
   end();
 }
@@ -153,7 +146,7 @@ bool OwnThreadQueue::waitForWork() {
 }
 
 std::size_t OwnThreadQueue::help(HelpingThread& helper, std::size_t limit) {
-  const JobRunner::Scope scope(this);
+  const JobRunner::Scope scope(this, label_);
   std::size_t done = 0;
   bool mustWake = false;
   {

@@ -46,6 +46,7 @@ class OwnThreadQueue final : public DispatchQueue,
   void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
               std::optional<std::chrono::nanoseconds> timeout,
               std::function<void(WaitOutcome)> then) override;
+  [[nodiscard]] const std::string& label() const { return label_; }
   [[nodiscard]] bool isCurrent() const override { return JobRunner::isCurrent(this); }
 
   // Lets the thread end once all jobs have run. Nobody adds jobs any more.

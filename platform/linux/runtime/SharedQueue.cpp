@@ -9,14 +9,37 @@
 #include "platform/linux/runtime/DispatchPool.h"
 
 namespace halvox::platform::linux_ {
+namespace {
+
+// Shows a queue as being at work for a scope.
+class AtWork {
+ public:
+  explicit AtWork(QueueLabel& label) : label_(label) {
+    label_.atWork.fetch_add(1, std::memory_order_relaxed);
+  }
+  AtWork(const AtWork&) = delete;
+  AtWork& operator=(const AtWork&) = delete;
+  ~AtWork() { label_.atWork.fetch_sub(1, std::memory_order_relaxed); }
+
+ private:
+  QueueLabel& label_;
+};
+
+}  // namespace
+
+SharedQueue::SharedQueue(std::shared_ptr<DispatchPool> pool, std::string_view label,
+                         QualityOfService quality)
+    : pool_(std::move(pool)), label_(pool_->labels().label(label)), quality_(quality) {}
 
 void SharedQueue::async(JobWeight /*weight*/, Job job) {
   if (pool_->isStopped()) return pool_->runner().countDiscarded(1);
   {
     const MutexLock lock(mutex_);
     jobs_.push_back(std::move(job));
+    label_.added.add();
     if (hasTurn_ || isWaiting_) return;
     hasTurn_ = true;
+    pool_->beginTurn();
   }
   askForTurn();
 }
@@ -39,10 +62,12 @@ void SharedQueue::resume(Job then) {
   {
     const MutexLock lock(mutex_);
     jobs_.push_front(std::move(then));
+    label_.added.add();
     isWaiting_ = false;
     // The job that began the wait may not have returned yet.
     if (hasTurn_) return;
     hasTurn_ = true;
+    pool_->beginTurn();
   }
   askForTurn();
 }
@@ -55,11 +80,12 @@ void SharedQueue::askForTurn() {
 
 void SharedQueue::beginTurn() {
   if (pool_->isStopped()) return discardJobs();
-  asio::post(pool_->context(), [self = shared_from_this()] { self->runTurn(); });
+  asio::post(pool_->context(quality_), [self = shared_from_this()] { self->runTurn(); });
 }
 
 void SharedQueue::runTurn() {
-  const JobRunner::Scope scope(this);
+  const JobRunner::Scope scope(this, label_.text);
+  const AtWork atWork(label_);
   for (int ran = 0; ran < kJobsPerTurn; ++ran) {
     if (pool_->isStopped()) return discardJobs();
     if (!runNext()) return;
@@ -74,12 +100,14 @@ bool SharedQueue::runNext() {
     const MutexLock lock(mutex_);
     if (isWaiting_ || jobs_.empty()) {
       hasTurn_ = false;
+      pool_->endTurn();
       return false;
     }
     job = std::move(jobs_.front());
     jobs_.pop_front();
   }
   pool_->runner().run(job);
+  label_.run.add();
   return true;
 }
 
@@ -87,6 +115,7 @@ void SharedQueue::discardJobs() {
   std::deque<Job> discarded;
   {
     const MutexLock lock(mutex_);
+    if (hasTurn_) pool_->endTurn();
     hasTurn_ = false;
     discarded.swap(jobs_);
   }

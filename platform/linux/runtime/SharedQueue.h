@@ -5,16 +5,19 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <string_view>
 
 #include "platform/dispatch.h"
 #include "platform/linux/Mutex.h"
 #include "platform/linux/runtime/JobRunner.h"
+#include "platform/linux/runtime/QueueLabels.h"
 
 namespace halvox::platform::linux_ {
 
 class DispatchPool;
 
-// A serial queue on the pool, whose jobs can wait on semaphores. Takes turns on the pool's threads:
+// A serial queue on the pool, whose jobs can wait on semaphores. Takes turns on the pool's threads
+// of its quality:
 //
 //   idle --a job comes--> has a turn --no job is left--> idle
 //                            |    ^
@@ -25,7 +28,7 @@ class DispatchPool;
 // Shared by its holders, its turn and its wait.
 class SharedQueue final : public DispatchQueue, public std::enable_shared_from_this<SharedQueue> {
  public:
-  explicit SharedQueue(std::shared_ptr<DispatchPool> pool) : pool_(std::move(pool)) {}
+  SharedQueue(std::shared_ptr<DispatchPool> pool, std::string_view label, QualityOfService quality);
 
   void async(JobWeight weight, Job job) override;
   // Throws std::logic_error, which fails the job, when called outside the jobs of the queue, twice
@@ -51,6 +54,8 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
   [[nodiscard]] bool runNext();
 
   const std::shared_ptr<DispatchPool> pool_;
+  QueueLabel& label_;  // owned by the pool
+  const QualityOfService quality_;
   Mutex mutex_;
   std::deque<Job> jobs_ HALVOX_GUARDED_BY(mutex_);
   bool hasTurn_ HALVOX_GUARDED_BY(mutex_) = false;  // one is to come or under way

@@ -44,7 +44,7 @@ bool CallbackThread::provideThread() {
 }
 
 void CallbackThread::run() {
-  setUpThread("link callbacks");
+  setUpThread("link callbacks", QualityOfService::kUtility);
   while (true) {
     Callback next;
     {

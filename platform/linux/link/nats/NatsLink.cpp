@@ -46,9 +46,10 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
     const bool isRefused = closeBy_.has_value();
     if (!isRefused) failure = provideThread();
     if (!isRefused && failure.empty()) {
+      wakeThread();
+      if (isConnected_) return answers_.push_back({std::move(found), servers_});
       waiter = ++lastWaiter_;
       waiters_.push_back({waiter, std::move(found)});
-      wakeThread();
     }
   }
   if (!failure.empty()) kLog.error("no server of the link is looked for: ", failure);
@@ -211,6 +212,7 @@ NatsLink::Step NatsLink::nextStepConnected(Time now) {
 NatsLink::Step NatsLink::nextStep(Time now) {
   if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
   if (isAtEnd(now)) return Step::kEnd;
+  if (!answers_.empty()) return Step::kTell;
   if (isLost_) return Step::kDrop;
   if (const auto deadline = pending_.firstDeadline(); deadline && now >= *deadline) {
     return Step::kGiveUp;
@@ -244,7 +246,7 @@ void NatsLink::waitForChange() {
 }
 
 void NatsLink::run() {
-  setUpThread("com.tarno.halvox.link");
+  setUpThread("com.tarno.halvox.link", QualityOfService::kUtility);
   while (true) {
     Step step = Step::kWait;
     {
@@ -254,6 +256,9 @@ void NatsLink::run() {
     }
     switch (step) {
       case Step::kWait:
+        break;
+      case Step::kTell:
+        tellAnswers();
         break;
       case Step::kAnswer:
         answerWaiters();
@@ -296,6 +301,7 @@ void NatsLink::end() {
   changed_.notifyAll();
 }
 
+// Those that wait for servers learn of them, or that there are none.
 void NatsLink::answerWaiters() {
   std::vector<Waiter> waiters;
   std::optional<Array> servers;
@@ -304,7 +310,18 @@ void NatsLink::answerWaiters() {
     waiters.swap(waiters_);
     if (isConnected_) servers = servers_;
   }
+  tellAnswers();
   for (const Waiter& waiter : waiters) waiter.found(servers);
+}
+
+// Those that asked while there was a server.
+void NatsLink::tellAnswers() {
+  std::vector<Answer> answers;
+  {
+    const MutexLock lock(mutex_);
+    answers.swap(answers_);
+  }
+  for (const Answer& answer : answers) answer.found(answer.servers);
 }
 
 }  // namespace halvox::platform::linux_

@@ -101,7 +101,22 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
     std::uint64_t id;
     TLMReportingService::BackendsCallback found;
   };
-  enum class Step : std::uint8_t { kWait, kAnswer, kConnect, kProbe, kSend, kGiveUp, kDrop, kEnd };
+  // What was known when it was asked for; only the thread has to tell it.
+  struct Answer {
+    TLMReportingService::BackendsCallback found;
+    Array servers;
+  };
+  enum class Step : std::uint8_t {
+    kWait,
+    kTell,
+    kAnswer,
+    kConnect,
+    kProbe,
+    kSend,
+    kGiveUp,
+    kDrop,
+    kEnd
+  };
   enum class Flow : std::uint8_t { kFlowing, kHolding, kProbing };
 
   // The thread (NatsLink.cpp).
@@ -118,6 +133,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   void giveUpRest() HALVOX_EXCLUDES(mutex_);
   void keepForEver();
   void answerWaiters() HALVOX_EXCLUDES(mutex_);
+  void tellAnswers() HALVOX_EXCLUDES(mutex_);
   void expire(std::uint64_t waiter) HALVOX_EXCLUDES(mutex_);
   void countRefused();
   // Provides the thread when the message can be taken.
@@ -183,6 +199,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   std::string lastFailure_ HALVOX_GUARDED_BY(mutex_);  // empty when the last attempt succeeded
   std::uint64_t lastWaiter_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::vector<Waiter> waiters_ HALVOX_GUARDED_BY(mutex_);
+  std::vector<Answer> answers_ HALVOX_GUARDED_BY(mutex_);
   Array servers_ HALVOX_GUARDED_BY(mutex_);
   std::deque<OutgoingMessage> queue_ HALVOX_GUARDED_BY(mutex_);
   std::size_t queuedBytes_ HALVOX_GUARDED_BY(mutex_) = 0;

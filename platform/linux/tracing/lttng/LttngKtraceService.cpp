@@ -126,8 +126,9 @@ void LttngKtraceService::close() {
 std::shared_ptr<DispatchQueue> LttngKtraceService::readingQueue() {
   const MutexLock lock(mutex_);
   if (readingQueue_ == nullptr) {
+    // A stop waits for it on the reporting queue, so it must not run after what gives way.
     readingQueue_ = platform::dispatch().createSerialQueue(
-        "Trace Reading", QualityOfService::kUtility, QueueThreading::kOwnThread);
+        "Trace Reading", QualityOfService::kUserInteractive, QueueThreading::kOwnThread);
   }
   return readingQueue_;
 }

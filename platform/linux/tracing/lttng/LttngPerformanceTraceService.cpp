@@ -183,8 +183,9 @@ void LttngPerformanceTraceService::close() {
 std::shared_ptr<DispatchQueue> LttngPerformanceTraceService::queue() {
   const MutexLock lock(mutex_);
   if (queue_ == nullptr) {
-    queue_ = platform::dispatch().createSerialQueue("Performance Trace", QualityOfService::kUtility,
-                                                    QueueThreading::kOwnThread);
+    // A stop waits for it on the reporting queue, so it must not run after what gives way.
+    queue_ = platform::dispatch().createSerialQueue(
+        "Performance Trace", QualityOfService::kUserInteractive, QueueThreading::kOwnThread);
   }
   return queue_;
 }
