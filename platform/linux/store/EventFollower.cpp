@@ -62,22 +62,12 @@ std::optional<StoreError> EventFollower::open(const std::filesystem::path& direc
 }
 
 std::optional<StoreError> EventFollower::deliver(const StoreReader::EventCallback& callback) {
-  return deliverBy([&] {
-    return reader_.forEachEvent(filter_, [&](const StoredEvent& event) {
-      filter_.after = std::max(filter_.after, event.id);
-      callback(event);
-    });
-  });
+  return deliverBy([&] { return reader_.forEachEvent(filter_, callback); });
 }
 
 std::optional<StoreError> EventFollower::deliver(const RecordTable& table,
                                                  const StoreReader::RecordCallback& callback) {
-  return deliverBy([&] {
-    return reader_.forEachRecord(table, filter_, [&](const StoredRecord& record) {
-      filter_.after = std::max(filter_.after, record.id);
-      callback(record);
-    });
-  });
+  return deliverBy([&] { return reader_.forEachRecord(table, filter_, callback); });
 }
 
 template <typename Read>
@@ -98,6 +88,9 @@ std::optional<StoreError> EventFollower::deliverBy(Read read) {
   if (!isOpen) return std::nullopt;
   started_ = true;
   auto error = read();
+  // Not after the last record that was delivered: when the filter lets none through, as `newest` 0
+  // does, everything that is stored would count as new the next time.
+  if (!error.has_value()) filter_.after = std::max(filter_.after, reader_.lastRead());
   filter_.newest.reset();
   return error;
 }

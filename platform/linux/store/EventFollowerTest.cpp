@@ -46,6 +46,17 @@ TEST_F(EventFollowerTest, DeliversStoredEventsFirstThenNewOnes) {
   EXPECT_THAT(seen, ElementsAre(numbered(4), numbered(5), numbered(6)));
 }
 
+TEST_F(EventFollowerTest, DeliversOnlyWhatComesWhenNoneOfTheNewestAreWanted) {
+  start();
+  for (std::int64_t number = 0; number < 5; ++number) send(number);
+  ASSERT_TRUE(allIsStored());
+  ASSERT_EQ(follower.open(options.directory, {.newest = 0}), std::nullopt);
+  ASSERT_TRUE(follow(0));
+  send(5);
+  ASSERT_TRUE(follow(1));
+  EXPECT_THAT(seen, ElementsAre(numbered(5)));
+}
+
 TEST_F(EventFollowerTest, LosesAndRepeatsNothingUnderLoad) {
   constexpr std::size_t kEvents = 20'000;
   start();

@@ -38,6 +38,10 @@ class EventScan {
   [[nodiscard]] SqliteCode next(Piece& piece);
   [[nodiscard]] bool isAtEnd() const { return bounds_.first > bounds_.last; }
 
+  // The last event that the whole pass looks at, whether the filter lets it through or not; known
+  // after begin().
+  [[nodiscard]] StoredRecordID last() const { return 2 * bounds_.last + 1; }
+
   [[nodiscard]] std::string_view nameOf(std::int64_t nameID) { return name(nameID).text; }
 
  private:

@@ -119,8 +119,12 @@ bool RecordScan::passes(const Statement& row) const {
     const std::int64_t number = row.integer(columnOf(match.column));
     if (std::ranges::find(match.numbers, number) == match.numbers.end()) return false;
   }
-  return table_.nameColumn == kNoColumn || filter_.names.empty() ||
-         matchesAny(filter_.names, std::string(row.text(columnOf(table_.nameColumn))));
+  const bool hasName =
+      table_.nameColumn == kNoColumn || filter_.names.empty() ||
+      matchesAny(filter_.names, std::string(row.text(columnOf(table_.nameColumn))));
+  if (!hasName || !filter_.accepts) return hasName;
+  std::size_t ignored = 0;
+  return filter_.accepts(read(row, ignored));
 }
 
 StoredRecord RecordScan::read(const Statement& row, std::size_t& bytes) const {

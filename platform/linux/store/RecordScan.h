@@ -46,6 +46,9 @@ class RecordScan {
   // Reads the next piece. An empty piece is not the end: more may follow until isAtEnd().
   [[nodiscard]] SqliteCode next(std::vector<StoredRecord>& piece);
   [[nodiscard]] bool isAtEnd() const { return bounds_.first > bounds_.last; }
+  // The last record that the whole pass looks at, whether the filter lets it through or not; known
+  // after begin().
+  [[nodiscard]] StoredRecordID last() const { return bounds_.last; }
 
  private:
   [[nodiscard]] bool passes(const Statement& row) const;

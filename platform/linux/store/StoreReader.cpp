@@ -106,6 +106,7 @@ std::optional<StoreError> StoreReader::forEachEvent(const RecordFilter& filter,
     }
   }
   if (code != SQLITE_OK) return failure(code);
+  lastRead_ = scan.last();
   return std::nullopt;
 }
 
@@ -116,6 +117,7 @@ std::optional<StoreError> StoreReader::forEachRecord(const RecordTable& table,
   // Read for each call: a service may have migrated the store since it was opened.
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
+  lastRead_ = 0;
   if (*version < table.sinceVersion) return std::nullopt;
   RecordScan scan(database_, table, filter);
   SqliteCode code = scan.begin();
@@ -125,6 +127,7 @@ std::optional<StoreError> StoreReader::forEachRecord(const RecordTable& table,
     for (const StoredRecord& record : piece) callback(record);
   }
   if (code != SQLITE_OK) return failure(code);
+  lastRead_ = scan.last();
   return std::nullopt;
 }
 

@@ -26,17 +26,6 @@ struct NumberMatch {
   std::vector<std::int64_t> numbers;
 };
 
-// Which records to read. A member that is not set selects everything.
-struct RecordFilter {
-  // Patterns for fnmatch(3). The name must match at least one; kinds without a name ignore them.
-  std::vector<std::string> names{};
-  std::optional<double> since{};          // seconds since 1970, inclusive
-  std::optional<double> until{};          // seconds since 1970, exclusive
-  StoredRecordID after = 0;               // only records stored after this one
-  std::optional<std::uint64_t> newest{};  // at most this many, the newest
-  std::vector<NumberMatch> numbers{};     // all must match; events ignore them
-};
-
 // A stored event. Its views are valid during the callback only.
 struct StoredEvent {
   StoredRecordID id;
@@ -59,6 +48,19 @@ struct StoredRecord {
   [[nodiscard]] const std::string& text(std::size_t column) const {
     return std::get<std::string>(fields[column]);
   }
+};
+
+// Which records to read. A member that is not set selects everything.
+struct RecordFilter {
+  // Patterns for fnmatch(3). The name must match at least one; kinds without a name ignore them.
+  std::vector<std::string> names{};
+  std::optional<double> since{};          // seconds since 1970, inclusive
+  std::optional<double> until{};          // seconds since 1970, exclusive
+  StoredRecordID after = 0;               // only records stored after this one
+  std::optional<std::uint64_t> newest{};  // at most this many, the newest
+  std::vector<NumberMatch> numbers{};     // all must match; events ignore them
+  // A further condition; events ignore it. It is only asked of records that meet all others.
+  std::function<bool(const StoredRecord&)> accepts{};
 };
 
 // Reads a store without changing it, whether or not a service writes to it at the same time.
@@ -87,6 +89,10 @@ class StoreReader {
                                                         const RecordFilter& filter,
                                                         const RecordCallback& callback);
 
+  // The last record that the last complete reading looked at, whether the filter let it through or
+  // not. A reading after it misses no record.
+  [[nodiscard]] StoredRecordID lastRead() const { return lastRead_; }
+
   // Returns true when no store is open, or the path now leads to another database or to none. Call
   // open() again; record IDs may then start from 1.
   [[nodiscard]] bool isReplaced() const;
@@ -99,6 +105,7 @@ class StoreReader {
   std::optional<StoreFiles> files_;
   Database database_;
   std::optional<FileIdentity> identity_;
+  StoredRecordID lastRead_ = 0;
 };
 
 }  // namespace halvox::platform::linux_
