@@ -2,8 +2,6 @@
 
 #include <charconv>
 #include <cmath>
-#include <ctime>
-#include <limits>
 #include <span>
 
 #include "client/Vocabulary.h"
@@ -53,72 +51,18 @@ std::string listDomains() {
   return list;
 }
 
+// "Session_99": a category that has no name, in a domain.
+std::optional<client::Category> parseNumberInDomain(std::string_view text) {
+  const auto separator = text.find('_');
+  if (separator == std::string_view::npos) return std::nullopt;
+  const auto domain = client::findCategory(std::string(text.substr(0, separator)) + "_Undefined");
+  const auto number = parseWhole<std::uint16_t>(text.substr(separator + 1));
+  if (!domain || !number) return std::nullopt;
+  return *domain | *number;
+}
+
 ArgumentError unknown(std::string_view text, const std::string& expected) {
   return {"\"" + std::string(text) + "\" is not known; expected " + expected};
-}
-
-// The part of a time after its seconds: a fraction, then an offset or nothing.
-struct TimeTail {
-  double fraction = 0;
-  std::optional<long> offset;  // seconds east of Greenwich; none: local time
-};
-
-std::optional<TimeTail> parseTimeTail(const char* text) {
-  TimeTail tail;
-  if (*text == '.') {
-    const char* end = text + 1;
-    while (*end >= '0' && *end <= '9') ++end;
-    const auto fraction = parseReal(std::string("0").append(text, end));
-    if (end == text + 1 || !fraction) return std::nullopt;
-    tail.fraction = *fraction;
-    text = end;
-  }
-  if (*text == '\0') return tail;
-  std::tm zone{};
-  const std::string_view zoneText(text);
-  const char* end = zoneText == "z" ? text + 1 : strptime(text, "%z", &zone);
-  if (end == nullptr || *end != '\0') return std::nullopt;
-  tail.offset = zone.tm_gmtoff;
-  return tail;
-}
-
-std::optional<double> parseCalendarTime(const std::string& text) {
-  // strptime() would also take blanks and missing digits.
-  constexpr std::string_view kShape = "0000-00-00T00:00:00";
-  if (text.size() < kShape.size()) return std::nullopt;
-  std::string start = text.substr(0, kShape.size());
-  if (start[10] == ' ' || start[10] == 't') start[10] = 'T';
-  for (std::size_t at = 0; at < kShape.size(); ++at) {
-    const bool isDigit = start[at] >= '0' && start[at] <= '9';
-    if (kShape[at] == '0' ? !isDigit : start[at] != kShape[at]) return std::nullopt;
-  }
-  std::tm fields{};
-  const char* end = strptime(start.c_str(), "%Y-%m-%dT%H:%M:%S", &fields);
-  const auto tail = parseTimeTail(text.c_str() + kShape.size());
-  if (end == nullptr || !tail) return std::nullopt;
-  const int day = fields.tm_mday;
-  fields.tm_isdst = -1;
-  const std::time_t seconds = tail->offset ? timegm(&fields) - *tail->offset : mktime(&fields);
-  if (fields.tm_mday != day) return std::nullopt;  // no such day: the 30th of February
-  return static_cast<double>(seconds) + tail->fraction;
-}
-
-std::optional<double> parseAge(std::string_view text) {
-  if (text.empty()) return std::nullopt;
-  const auto number = parseReal(text.substr(0, text.size() - 1));
-  if (!number || *number < 0) return std::nullopt;
-  switch (text.back()) {
-    case 's':
-      return *number;
-    case 'm':
-      return *number * 60;
-    case 'h':
-      return *number * 60 * 60;
-    case 'd':
-      return *number * 24 * 60 * 60;
-    default:
-      return std::nullopt;
-  }
 }
 
 }  // namespace
@@ -143,6 +87,7 @@ Parsed<std::uint64_t> parseCount(std::string_view text) {
 Parsed<client::Category> parseCategory(std::string_view text) {
   if (const auto number = parseWhole<client::Category>(text)) return *number;
   if (const auto category = client::findCategory(text)) return *category;
+  if (const auto category = parseNumberInDomain(text)) return *category;
   return unknown(text, "a number of 32 bits or one of " + listNames(client::categories()) +
                            ", alone or behind one of " + listDomains());
 }
@@ -167,15 +112,6 @@ Parsed<std::chrono::milliseconds> parseSeconds(std::string_view text) {
                          "\" is no time; expected seconds, more than 0, such as 0.5 or 10"};
   }
   return std::chrono::ceil<std::chrono::milliseconds>(std::chrono::duration<double>(*seconds));
-}
-
-Parsed<double> parseTime(std::string_view text, double now) {
-  if (const auto seconds = parseReal(text)) return *seconds;
-  if (const auto age = parseAge(text)) return now - *age;
-  if (const auto time = parseCalendarTime(std::string(text))) return *time;
-  return ArgumentError{"\"" + std::string(text) +
-                       "\" is no time; expected a date such as 2026-03-01T12:00:00Z, seconds since "
-                       "1970, or how long ago: 90s, 5m, 2h, 3d"};
 }
 
 }  // namespace halvox::tools

@@ -30,8 +30,5 @@ Parsed<client::EventType> parseEventType(std::string_view text);
 Parsed<client::ServiceType> parseServiceType(std::string_view text);
 // Seconds, fractions allowed; more than 0.
 Parsed<std::chrono::milliseconds> parseSeconds(std::string_view text);
-// A moment, in seconds since 1970: RFC 3339 (without an offset in local time), the seconds
-// themselves, or how long before `now` it was (90s, 5m, 2h, 3d).
-Parsed<double> parseTime(std::string_view text, double now);
 
 }  // namespace halvox::tools

@@ -1,14 +1,9 @@
 #include "tools/Arguments.h"
 
-#include <cstdlib>
-#include <ctime>
-
 #include <gtest/gtest.h>
 
 namespace halvox::tools {
 namespace {
-
-constexpr double kNow = 1'000'000;
 
 template <typename T>
 std::optional<T> valueOf(const Parsed<T>& parsed) {
@@ -72,36 +67,6 @@ TEST(ArgumentsTest, SecondsMayBeFractionsButNotNothing) {
   EXPECT_EQ(valueOf(parseSeconds("0.0001")), std::chrono::milliseconds(1));
   for (const char* wrong : {"", "0", "-1", "inf", "nan", "1e99", "5s"}) {
     EXPECT_FALSE(valueOf(parseSeconds(wrong))) << wrong;
-  }
-}
-
-TEST(ArgumentsTest, TimesAreDatesSecondsOrAges) {
-  EXPECT_EQ(valueOf(parseTime("1970-01-02T00:00:00Z", kNow)), 86'400.0);
-  EXPECT_EQ(valueOf(parseTime("1970-01-02T01:00:00+01:00", kNow)), 86'400.0);
-  EXPECT_EQ(valueOf(parseTime("1970-01-02 00:00:00.25Z", kNow)), 86'400.25);
-  EXPECT_EQ(valueOf(parseTime("1234.5", kNow)), 1234.5);
-  EXPECT_EQ(valueOf(parseTime("90s", kNow)), kNow - 90);
-  EXPECT_EQ(valueOf(parseTime("5m", kNow)), kNow - 300);
-  EXPECT_EQ(valueOf(parseTime("1.5h", kNow)), kNow - 5400);
-  EXPECT_EQ(valueOf(parseTime("2d", kNow)), kNow - 172'800);
-}
-
-TEST(ArgumentsTest, DatesWithoutOffsetAreLocal) {
-  setenv("TZ", "XXX-02", 1);  // two hours east
-  tzset();
-
-  EXPECT_EQ(valueOf(parseTime("1970-01-02T02:00:00", kNow)), 86'400.0);
-
-  unsetenv("TZ");
-  tzset();
-}
-
-TEST(ArgumentsTest, WhatIsNoTimeIsRefused) {
-  for (const char* wrong :
-       {"", "yesterday", "5 m", "-5m", "m", "2026-02-30T00:00:00Z", "2026-13-01T00:00:00Z",
-        "2026-1-1T00:00:00Z", "2026-01-01", "2026-01-01T00:00:00X", "2026-01-01T00:00:00.Z",
-        "2026-01-01T00:00:00Z "}) {
-    EXPECT_FALSE(valueOf(parseTime(wrong, kNow))) << wrong;
   }
 }
 

@@ -31,7 +31,7 @@ struct CommandGroup {
 // All commands there are, in the order of the help.
 constexpr CommandGroup kGroups[] = {
     {"Requests to the service", addRequestCommands, GroupPlace::kAnywhere},
-    {"In scripts only", addScriptRequests, GroupPlace::kScriptLines},
+    {"Waiting", addScriptRequests, GroupPlace::kScriptLines},
     {"Requests that belong together", addScriptCommands, GroupPlace::kArguments},
     {"What the service stored", addRecordCommands, GroupPlace::kArguments},
     {"What the service stored", addSnapshotCommands, GroupPlace::kArguments},
@@ -71,10 +71,19 @@ void addGroups(CommandSet& commands, CommandSource source) {
   }
 }
 
+// The library has the options of a program before its command; a line has none there.
+class HelpFormatter final : public CLI::Formatter {
+ public:
+  std::string make_usage(const CLI::App* app, std::string name) const override {
+    if (app->get_parent() != nullptr || !name.empty()) return Formatter::make_usage(app, name);
+    return "Usage: COMMAND [ARGUMENT]...\n";
+  }
+};
+
 // What the library calls by names of its own, in ours; commands take it from the program.
 void nameThings(CLI::App& app) {
   app.set_help_flag("-h,--help", "Print this help");
-  const auto formatter = std::make_shared<CLI::Formatter>();
+  const auto formatter = std::make_shared<HelpFormatter>();
   formatter->label("SUBCOMMAND", "COMMAND");
   formatter->label("Positionals", "Arguments");
   formatter->label("REQUIRED", "(required)");
@@ -178,7 +187,11 @@ std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string>
   CLI::App app("Talks to the Halvox reporting service, and shows what it stored.");
   nameThings(app);
   CommandSet commands(app, source, input);
-  if (source == CommandSource::kArguments) {
+  if (source == CommandSource::kScriptLine) {
+    app.description("Requests to the Halvox reporting service, one a line, over one connection.");
+    app.footer(
+        "'COMMAND --help' explains a command; 'quit' or the end of the input ends the shell.");
+  } else {
     app.name("halvoxctl");
     app.set_version_flag("--version", std::string("halvoxctl ") + kHalvoxVersion,
                          "Print the version");

@@ -170,7 +170,15 @@ TEST(CommandLineTest, LinkMessagesAreChosenBySessionServiceCategoryAndType) {
   EXPECT_EQ(link.types, std::vector<std::int64_t>{9});
   EXPECT_EQ(link.selection.database, "d");
   EXPECT_EQ(errorOf({"link", "--type", "x"}),
-            "halvoxctl link: --type: \"x\" is no number; expected a whole number");
+            errorOf({"send", "--type", "x"}).replace(10, 4, "link"));
+}
+
+TEST(CommandLineTest, LinkMessagesAreChosenByNamesToo) {
+  const auto link = runOf<ShowRecords>({"link", "--category", "Session_Playback", "--category",
+                                        "error", "--type", "Start", "--type", "State"});
+
+  EXPECT_EQ(link.categories, (std::vector<std::int64_t>{0x08000004, 11}));
+  EXPECT_EQ(link.types, (std::vector<std::int64_t>{1, 18}));
 }
 
 TEST(CommandLineTest, SnapshotsOfThemselvesAreListed) {
@@ -204,7 +212,9 @@ TEST(CommandLineTest, ErrorsNameTheCommandAndTheArgument) {
   EXPECT_EQ(errorOf({"list", "--timeout", "0"}),
             "halvoxctl list: --timeout: \"0\" is no time; expected seconds, more than 0, such as "
             "0.5 or 10");
-  EXPECT_EQ(errorOf({"configure", "7", "{"}).substr(0, 34), "halvoxctl configure: JSON: no JSON");
+  EXPECT_EQ(errorOf({"configure", "7", "{"}),
+            "halvoxctl configure: JSON: line 1, column 2: expected a name in double quotes, found "
+            "the end of the text");
 }
 
 TEST(CommandLineTest, CountsAndActionsThatAreNoneAreNamedWithWhatIsExpected) {
@@ -331,6 +341,15 @@ TEST(CommandLineTest, HelpOnCreateTellsHowLongASessionLives) {
 
   EXPECT_NE(std::get<CommandLineText>(parsed).text.find("lives as long as the connection"),
             std::string::npos);
+}
+
+TEST(CommandLineTest, TheHelpOfTheShellIsAboutItsLines) {
+  const auto parsed = parse({"--help"}, "", CommandSource::kScriptLine);
+  const std::string& text = std::get<CommandLineText>(parsed).text;
+
+  EXPECT_NE(text.find("Usage: COMMAND [ARGUMENT]...\n"), std::string::npos) << text;
+  EXPECT_EQ(text.find("Usage: [OPTIONS]"), std::string::npos) << text;
+  EXPECT_NE(text.find("'quit'"), std::string::npos) << text;
 }
 
 TEST(CommandLineTest, TellsItsVersion) {

@@ -2,8 +2,11 @@
 
 #include <algorithm>
 #include <chrono>
+#include <cmath>
 #include <iostream>
 #include <mutex>
+#include <set>
+#include <string>
 #include <variant>
 
 #include <poll.h>
@@ -39,29 +42,40 @@ class ErrorLog final : public platform::LogCategory {
 
 std::string numberText(double value) { return toJson(platform::Value(value)); }
 
-std::string count(std::uint64_t value, std::optional<double> seconds) {
+template <typename Number>
+std::string count(Number value, std::optional<double> seconds) {
   return seconds ? numberText(static_cast<double>(value) / *seconds) : std::to_string(value);
 }
 
-std::string signedCount(std::int64_t value, std::optional<double> seconds) {
-  return seconds ? numberText(static_cast<double>(value) / *seconds) : std::to_string(value);
+// What a person reads of a number per second: no more digits than the measured time is good for.
+std::string rateText(double rate) {
+  constexpr double kNoFractionFrom = 1000;
+  constexpr double kThreeDecimals = 1000;
+  if (std::abs(rate) >= kNoFractionFrom) return shortNumber(std::round(rate));
+  return shortNumber(std::round(rate * kThreeDecimals) / kThreeDecimals);
+}
+
+template <typename Number>
+std::string shownCount(Number value, std::optional<double> seconds) {
+  return seconds ? rateText(static_cast<double>(value) / *seconds) : std::to_string(value);
 }
 
 std::string textOf(const IOReportChannel& channel, std::optional<double> seconds) {
   if (channel.format == IOReportFormat::kSimple) {
-    return " " + signedCount(channel.integerValue, seconds);
+    return " " + shownCount(channel.integerValue, seconds);
   }
   std::string text;
   for (const auto& state : channel.states) {
     if (state.inTransitions == 0 && state.residency == 0) continue;
-    text += " " + harmlessText(state.name) + "=" + count(state.residency, seconds) + "(" +
-            count(state.inTransitions, seconds) + "x)";
+    text += " " + harmlessText(state.name) + "=" + shownCount(state.residency, seconds) + "(" +
+            shownCount(state.inTransitions, seconds) + "x)";
   }
   for (const auto& bucket : channel.buckets) {
     if (bucket.hits == 0) continue;
     const bool isOpen = bucket.upper == platform::kIOReportNoUpperBound;
     text += " " + std::to_string(bucket.lower) + "-" +
-            (isOpen ? "+Inf" : std::to_string(bucket.upper)) + ":" + count(bucket.hits, seconds);
+            (isOpen ? "+Inf" : std::to_string(bucket.upper)) + ":" +
+            shownCount(bucket.hits, seconds);
   }
   return text.empty() ? " 0" : text;
 }
@@ -114,7 +128,7 @@ std::string jsonLine(const IOReportChannel& channel, std::optional<double> secon
   } else if (channel.format == IOReportFormat::kHistogram) {
     json += bucketsJson(channel, seconds);
   } else {
-    json += "\"format\":\"simple\",\"value\":" + signedCount(channel.integerValue, seconds);
+    json += "\"format\":\"simple\",\"value\":" + count(channel.integerValue, seconds);
   }
   return harmlessJson(json + "}");
 }
@@ -131,6 +145,8 @@ class DriverPrinter {
     channels_ = service_.IOReportCopyChannelsInGroup(group, std::nullopt, error);
     subscription_ = service_.IOReportCreateSubscription(channels_, channels_, error);
   }
+
+  [[nodiscard]] bool hasChannels() const { return service_.IOReportGetChannelCount(channels_) > 0; }
 
   IOReportService::Samples sample() {
     std::optional<platform::IOReportError> error;
@@ -176,6 +192,24 @@ class DriverPrinter {
   IOReportService::Subscription subscription_;
 };
 
+// "the groups are Rx, Tx", of the channels that there are now.
+std::string groupsOf(IOReportService& service) {
+  std::optional<platform::IOReportError> error;
+  auto channels = service.IOReportCopyChannelsInGroup(std::nullopt, std::nullopt, error);
+  const auto subscription = service.IOReportCreateSubscription(channels, channels, error);
+  std::set<std::string> groups;
+  service.IOReportIterate(
+      service.IOReportCreateSamples(subscription, channels, *service.makeMoment(), error),
+      [&](const IOReportChannel& channel) {
+        if (channel.group) groups.emplace(*channel.group);
+        return 0;
+      });
+  if (groups.empty()) return "there are no channels at all now";
+  std::string list;
+  for (const std::string& group : groups) list += (list.empty() ? "" : ", ") + group;
+  return (groups.size() == 1 ? "the only group is " : "the groups are ") + list;
+}
+
 }  // namespace
 
 std::string formatChannel(const IOReportChannel& channel, std::optional<double> seconds,
@@ -185,7 +219,8 @@ std::string formatChannel(const IOReportChannel& channel, std::optional<double> 
 
 ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream& out,
                        int outputDescriptor, std::ostream& errors) {
-  const auto configuration = serviceConfiguration(Complaint("drivers", form, out, errors));
+  const Complaint complain("drivers", form, out, errors);
+  const auto configuration = serviceConfiguration(complain);
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   // Lives as long as the process, because the sources' log remembers it.
   static ErrorLog errorLog;
@@ -197,6 +232,10 @@ ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream
       statistics);
   service.open();
   DriverPrinter printer(service, request, form, out);
+  if (!request.group.empty() && !printer.hasChannels()) {
+    return complain(ExitStatus::kRefused, "nothing to show: there is no group \"" + request.group +
+                                              "\"; " + groupsOf(service));
+  }
   if (request.watch) {
     printer.watch(*request.watch, outputDescriptor);
   } else {

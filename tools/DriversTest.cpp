@@ -37,7 +37,7 @@ TEST(DriversTest, AChannelIsALineOfItsNamesItsValueAndItsUnit) {
 
 TEST(DriversTest, AWatchedChannelIsShownPerSecond) {
   EXPECT_EQ(formatChannel(frames(), 2.0, OutputForm::kText),
-            "HDA\\u001b  Tx  -  frames  48000.0 frames/s");
+            "HDA\\u001b  Tx  -  frames  48000 frames/s");
 }
 
 TEST(DriversTest, JsonHasAllNames) {
@@ -75,6 +75,18 @@ TEST(DriversTest, ABucketWithoutAnUpperBoundEndsAtInfinity) {
   EXPECT_EQ(formatChannel(histogram, std::nullopt, OutputForm::kText), "-  -  -  -  20-+Inf:3");
 }
 
+TEST(DriversTest, RatesHaveNoMoreDigitsThanAPersonReads) {
+  const std::array states{
+      IOReportState{.name = "suspended", .inTransitions = 0, .residency = 2'000'593},
+      IOReportState{.name = "on", .inTransitions = 1, .residency = 7}};
+  IOReportChannel state;
+  state.format = IOReportFormat::kState;
+  state.states = states;
+
+  EXPECT_EQ(formatChannel(state, 2.0000123, OutputForm::kText),
+            "-  -  -  -  suspended=1000290(0x) on=3.5(0.5x)/s");
+}
+
 class ShowDriversTest : public testing::Test {
  protected:
   ShowDriversTest() {
@@ -97,6 +109,18 @@ TEST_F(ShowDriversTest, TheChannelsOfAGroupAreReadFromTheConfiguredSources) {
 
   EXPECT_EQ(status, ExitStatus::kDone);
   EXPECT_EQ(out_.str(), "-  Tx  -  a  3\n");
+}
+
+TEST_F(ShowDriversTest, AGroupThatIsNotThereIsAnsweredWithThoseThatAre) {
+  for (const auto watch : {std::optional<std::chrono::milliseconds>(), {std::chrono::hours(1)}}) {
+    errors_.str("");
+    EXPECT_EQ(showDrivers({.group = "Nope", .watch = watch}, OutputForm::kText, out_, -1, errors_),
+              ExitStatus::kRefused);
+    EXPECT_EQ(errors_.str(),
+              "halvoxctl drivers: nothing to show: there is no group \"Nope\"; the groups are Rx, "
+              "Tx\n");
+  }
+  EXPECT_EQ(out_.str(), "");
 }
 
 TEST_F(ShowDriversTest, WatchingEndsWhenNobodyReads) {

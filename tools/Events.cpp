@@ -2,6 +2,7 @@
 
 #include "tools/JsonText.h"
 #include "tools/StoreRun.h"
+#include "tools/TimeText.h"
 
 namespace halvox::tools {
 

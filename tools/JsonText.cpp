@@ -2,20 +2,22 @@
 
 #include <algorithm>
 #include <array>
+#include <charconv>
 #include <cmath>
 #include <cstdint>
 #include <cstdio>
 #include <ctime>
 #include <limits>
+#include <sstream>
 #include <utility>
 #include <vector>
 
 #include <rapidjson/document.h>
-#include <rapidjson/error/en.h>
 #include <rapidjson/stringbuffer.h>
 #include <rapidjson/writer.h>
 
 #include "platform/linux/runtime/Utf8.h"
+#include "tools/JsonError.h"
 
 namespace halvox::tools {
 namespace {
@@ -120,9 +122,20 @@ void write(Writer& writer, std::string_view text) {
   writer.String(text.data(), static_cast<rapidjson::SizeType>(text.size()));
 }
 
+// A number as short as it reads back, which the library's own form is not always. In JSON it keeps
+// a fraction, so that it reads back as a double: 1.0.
+std::string jsonNumber(double number) {
+  std::string text = shortNumber(number);
+  return text.find_first_not_of("-0123456789") == std::string::npos ? text + ".0" : text;
+}
+
+bool writeRaw(Writer& writer, const std::string& number) {
+  return writer.RawValue(number.data(), number.size(), rapidjson::kNumberType);
+}
+
 void writeDouble(Writer& writer, double number) {
   if (std::isfinite(number)) {
-    writer.Double(number);
+    writeRaw(writer, jsonNumber(number));
   } else if (std::isnan(number)) {
     writer.String("NaN");
   } else {
@@ -230,9 +243,16 @@ bool canStandWithoutQuotes(std::string_view text) {
   return !text.empty() && text.find_first_of(" \"'=\\{}[],") == std::string_view::npos;
 }
 
+// Writes parsed JSON again, with numbers for people.
+class FieldWriter final : public Writer {
+ public:
+  using Writer::Writer;
+  bool Double(double number) { return writeRaw(*this, shortNumber(number)); }
+};
+
 std::string compact(const rapidjson::Value& json) {
   rapidjson::StringBuffer buffer;
-  Writer writer(buffer);
+  FieldWriter writer(buffer);
   json.Accept(writer);
   return {buffer.GetString(), buffer.GetSize()};
 }
@@ -243,8 +263,9 @@ Parsed<Dictionary> parseDictionary(std::string_view json) {
   rapidjson::Document document;
   document.Parse<kParseFlags>(json.data(), json.size());
   if (document.HasParseError()) {
-    return ArgumentError{"no JSON: at byte " + std::to_string(document.GetErrorOffset() + 1) +
-                         ": " + rapidjson::GetParseError_En(document.GetParseError())};
+    std::istringstream text{std::string(json)};
+    return ArgumentError{
+        describeJsonError(text, document.GetErrorOffset(), document.GetParseError())};
   }
   if (!document.IsObject()) {
     return ArgumentError{"expected a JSON object, such as {\"sample_rate\": 48000}"};
@@ -253,6 +274,12 @@ Parsed<Dictionary> parseDictionary(std::string_view json) {
   Dictionary dictionary;
   if (!converter.convert(document, dictionary)) return converter.error();
   return dictionary;
+}
+
+std::string shortNumber(double number) {
+  std::array<char, 32> text{};  // the longest double has 24 characters
+  const auto written = std::to_chars(text.data(), text.data() + text.size(), number);
+  return {text.data(), written.ptr};
 }
 
 std::string toJson(const Value& value) {

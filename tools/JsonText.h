@@ -14,6 +14,9 @@ namespace halvox::tools {
 // that occurs twice and anything but one object.
 Parsed<platform::Dictionary> parseDictionary(std::string_view json);
 
+// A finite number with as few digits as it takes to read the same number back: "0.1", "48000".
+std::string shortNumber(double number);
+
 // A value as JSON on one line: dates as RFC 3339 text, data as hexadecimal text, and numbers that
 // JSON cannot hold as the texts "NaN", "Infinity" and "-Infinity".
 std::string toJson(const platform::Value& value);

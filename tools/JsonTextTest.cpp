@@ -64,7 +64,7 @@ TEST(JsonTextTest, RefusesAKeyThatOccursTwice) {
 }
 
 TEST(JsonTextTest, SaysWhereTextIsNoJson) {
-  EXPECT_EQ(errorOf(R"({"a": 1,})").substr(0, 20), "no JSON: at byte 9: ");
+  EXPECT_EQ(errorOf(R"({"a": 1,})").substr(0, 19), "line 1, column 9: e");
   EXPECT_NE(errorOf(""), "");
   EXPECT_NE(errorOf(R"({"a": 1} x)"), "");
   EXPECT_NE(errorOf("{\"a\": \"\xFF\"}"), "");
@@ -91,6 +91,14 @@ TEST(JsonTextTest, ValuesBecomeJson) {
             R"({"a":[1,2.5,true,"x\"y"],"b":{}})");
   EXPECT_EQ(toJson(Array{std::nan(""), HUGE_VAL, -HUGE_VAL}), R"(["NaN","Infinity","-Infinity"])");
   EXPECT_EQ(toJson(Array{INT64_MIN, UINT64_MAX}), "[-9223372036854775808,18446744073709551615]");
+}
+
+TEST(JsonTextTest, NumbersAreAsShortAsTheyReadBack) {
+  const double latency = 2048.0 / 48000;
+
+  EXPECT_EQ(toJson(Array{latency, 0.1, 1.0, 1e300}), "[0.042666666666666665,0.1,1.0,1e+300]");
+  EXPECT_EQ(fieldsOfJson(R"({"a":0.042666666666666665,"b":{"c":[48000.0,-0.5]}})"),
+            R"(a=0.042666666666666665 b={"c":[48000,-0.5]})");
 }
 
 TEST(JsonTextTest, TextForATerminalHasNoControlCharacters) {

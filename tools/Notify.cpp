@@ -1,8 +1,12 @@
 #include "tools/Notify.h"
 
+#include <algorithm>
+#include <array>
 #include <cerrno>
 #include <cstring>
 #include <filesystem>
+#include <string>
+#include <string_view>
 #include <system_error>
 #include <variant>
 
@@ -18,6 +22,14 @@ namespace halvox::tools {
 using platform::linux_::Configuration;
 using platform::linux_::UniqueFd;
 
+namespace {
+
+// What the service listens for.
+constexpr std::array<std::string_view, 2> kNotifications{
+    "com.tarno.halvox.reporting", "com.tarno.pavisk.spatial-audio-accessory-feature.changed"};
+
+}  // namespace
+
 ExitStatus postNotification(const PostNotification& request, OutputForm form, std::ostream& out,
                             std::ostream& errors) {
   const Complaint complain("notify", form, out, errors);
@@ -25,6 +37,12 @@ ExitStatus postNotification(const PostNotification& request, OutputForm form, st
     return complain(ExitStatus::kBadArguments,
                     "NAME: " + platform::linux_::shownName(request.name) +
                         " cannot be a notification; expected the name of a file, without \"/\"");
+  }
+  if (std::ranges::find(kNotifications, request.name) == kNotifications.end()) {
+    return complain(ExitStatus::kBadArguments,
+                    "NAME: nothing was posted: the service does not listen for " +
+                        platform::linux_::shownName(request.name) + "; expected " +
+                        std::string(kNotifications[0]) + " or " + std::string(kNotifications[1]));
   }
   const auto found =
       settingsDirectory(request.directory, &Configuration::notifyDirectory, complain);

@@ -12,6 +12,9 @@
 namespace halvox::tools {
 namespace {
 
+const std::string kName = "com.tarno.halvox.reporting";
+const std::string kOther = "com.tarno.pavisk.spatial-audio-accessory-feature.changed";
+
 class NotifyTest : public testing::Test {
  protected:
   ExitStatus post(const std::string& name) {
@@ -27,20 +30,20 @@ class NotifyTest : public testing::Test {
 };
 
 TEST_F(NotifyTest, MakesTheDirectoryAndTheFile) {
-  EXPECT_EQ(post("org.example.changed"), ExitStatus::kDone);
+  EXPECT_EQ(post("com.tarno.halvox.reporting"), ExitStatus::kDone);
 
-  EXPECT_TRUE(std::filesystem::is_regular_file(directory_ + "/org.example.changed"));
+  EXPECT_TRUE(std::filesystem::is_regular_file(directory_ + "/com.tarno.halvox.reporting"));
   EXPECT_EQ(errors_.str(), "");
 }
 
 TEST_F(NotifyTest, TouchesAFileThatIsThereAndLeavesItsContent) {
-  ASSERT_EQ(post("name"), ExitStatus::kDone);
-  const std::string file = directory_ + "/name";
+  ASSERT_EQ(post(kName), ExitStatus::kDone);
+  const std::string file = directory_ + "/" + kName;
   std::ofstream(file) << "text";
   const auto longAgo = std::filesystem::file_time_type::clock::now() - std::chrono::hours(1);
   std::filesystem::last_write_time(file, longAgo);
 
-  EXPECT_EQ(post("name"), ExitStatus::kDone);
+  EXPECT_EQ(post(kName), ExitStatus::kDone);
 
   EXPECT_GT(std::filesystem::last_write_time(file), longAgo + std::chrono::minutes(59));
   EXPECT_EQ(std::filesystem::file_size(file), 4U);
@@ -54,12 +57,22 @@ TEST_F(NotifyTest, NamesThatLeaveTheDirectoryAreBadArguments) {
   EXPECT_FALSE(std::filesystem::exists(directory_));
 }
 
-TEST_F(NotifyTest, WhatIsNoFileIsToldAndBlocksNobody) {
-  ASSERT_EQ(post("other"), ExitStatus::kDone);
-  ASSERT_EQ(::mkfifo((directory_ + "/name").c_str(), 0600), 0);
+TEST_F(NotifyTest, NamesThatNobodyListensForArePostedToNobody) {
+  EXPECT_EQ(post("bogus"), ExitStatus::kBadArguments);
 
-  EXPECT_EQ(post("name"), ExitStatus::kCannotWrite);
-  EXPECT_NE(errors_.str().find(directory_ + "/name: "), std::string::npos);
+  EXPECT_EQ(errors_.str(),
+            "halvoxctl notify: NAME: nothing was posted: the service does not listen "
+            "for \"bogus\"; expected " +
+                kName + " or " + kOther + "\n");
+  EXPECT_FALSE(std::filesystem::exists(directory_));
+}
+
+TEST_F(NotifyTest, WhatIsNoFileIsToldAndBlocksNobody) {
+  ASSERT_EQ(post(kOther), ExitStatus::kDone);
+  ASSERT_EQ(::mkfifo((directory_ + "/" + kName).c_str(), 0600), 0);
+
+  EXPECT_EQ(post(kName), ExitStatus::kCannotWrite);
+  EXPECT_NE(errors_.str().find(directory_ + "/" + kName + ": "), std::string::npos);
 }
 
 }  // namespace

@@ -9,7 +9,9 @@
 
 #include "platform/protobuf.h"
 #include "tools/JsonText.h"
+#include "tools/LinkNames.h"
 #include "tools/StoreRun.h"
+#include "tools/TimeText.h"
 
 namespace halvox::tools {
 namespace {
@@ -118,10 +120,8 @@ std::string asText(ShowRecords::Kind kind, const StoredRecord& record) {
              fieldsOfJson(record.text(store::kPowerPayload));
     case ShowRecords::Kind::kLink:
       return std::to_string(record.number(store::kLinkSessionID)) + "  " +
-             harmlessText(record.text(store::kLinkServiceName)) + "  " +
-             std::to_string(record.number(store::kLinkCategory)) + "/" +
-             std::to_string(record.number(store::kLinkType)) + "  " +
-             fieldsOfJson(record.text(store::kLinkPayload));
+             harmlessText(record.text(store::kLinkServiceName)) + "  " + linkCategoryName(record) +
+             "/" + linkTypeName(record) + "  " + fieldsOfJson(record.text(store::kLinkPayload));
     case ShowRecords::Kind::kSnapshots:
       return harmlessText(record.text(store::kSnapshotPath)) + "  " +
              fieldsOfJson(record.text(store::kSnapshotSignature));
@@ -154,6 +154,10 @@ std::string asJson(ShowRecords::Kind kind, const StoredRecord& record) {
       kind == ShowRecords::Kind::kMetrics && record.number(store::kMetricID) == kAudioIssueDetected;
   const auto fields = isIssue ? audioIssueAsJson(record.text(store::kMetricMessage)) : std::nullopt;
   if (fields) json += ",\"fields\":" + harmlessJson(*fields);
+  if (kind == ShowRecords::Kind::kLink) {
+    json += ",\"category_name\":" + tools::quoted(linkCategoryName(record)) +
+            ",\"type_name\":" + tools::quoted(linkTypeName(record));
+  }
   return json + "}";
 }
 
@@ -171,8 +175,12 @@ RecordFilter filterOf(const ShowRecords& request) {
       break;
     case ShowRecords::Kind::kLink:
       add(store::kLinkSessionID, request.ids);
-      add(store::kLinkCategory, request.categories);
       add(store::kLinkType, request.types);
+      if (!request.categories.empty()) {
+        filter.accepts = [categories = request.categories](const StoredRecord& record) {
+          return isOfCategory(record, categories);
+        };
+      }
       break;
     case ShowRecords::Kind::kSnapshots:
       break;

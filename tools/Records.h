@@ -18,6 +18,8 @@ struct ShowRecords {
   RecordSelection selection{};  // its names are those of power events or of the link's services
   // Numbers that the records have; none: all.
   std::vector<std::int64_t> ids{};  // of metrics, or of the link's sessions
+  // Of power events, or of the link's messages with their domains; one without a domain stands for
+  // all domains.
   std::vector<std::int64_t> categories{};
   std::vector<std::int64_t> types{};
 };

@@ -127,10 +127,11 @@ TEST_F(RecordsTest, PowerEventsAreShownWithCategoryNameAndPayload) {
 TEST_F(RecordsTest, LinkMessagesAreShownWithTheirParty) {
   storeLink(100, -1, 3, 9);
 
-  EXPECT_EQ(shown(Kind::kLink), "1970-01-01 00:01:40.000  -1  music  3/9  a=1\n");
+  EXPECT_EQ(shown(Kind::kLink), "1970-01-01 00:01:40.000  -1  music  Input/AudioUnitUsage  a=1\n");
   EXPECT_EQ(shown(Kind::kLink, OutputForm::kJson),
             "{\"time\":100.0,\"session_id\":-1,\"client_name\":\"client\",\"service_name\":"
-            "\"music\",\"category\":3,\"type\":9,\"payload\":{\"a\":1}}\n");
+            "\"music\",\"category\":3,\"type\":9,\"payload\":{\"a\":1},"
+            "\"category_name\":\"Input\",\"type_name\":\"AudioUnitUsage\"}\n");
 }
 
 TEST_F(RecordsTest, SnapshotsAreShownWithPathAndSignature) {
@@ -150,7 +151,7 @@ TEST_F(RecordsTest, LinkMessagesAreChosenByTheirNumbersTogether) {
   const std::string one = shown(ShowRecords{Kind::kLink, {}, {7}, {2}, {5, 6}});
   const std::string newest = shown(ShowRecords{Kind::kLink, {.last = 1}, {7}, {}, {}});
 
-  EXPECT_EQ(one, "1970-01-01 00:01:42.000  7  music  2/5  a=1\n");
+  EXPECT_EQ(one, "1970-01-01 00:01:42.000  7  music  Record/Setup  a=1\n");
   EXPECT_EQ(newest, one);
 }
 
@@ -161,7 +162,7 @@ TEST_F(RecordsTest, NamesChooseAmongPowerEventsAndServices) {
   store_->powerEvents().add({.time = 100, .categoryID = 1, .eventName = "Other"});
 
   EXPECT_EQ(shown(ShowRecords{Kind::kLink, {.names = {"sp*"}}, {}, {}, {}}),
-            "1970-01-01 00:01:41.000  2  speech  1/1  a=1\n");
+            "1970-01-01 00:01:41.000  2  speech  Generic/Start  a=1\n");
   EXPECT_THAT(shown(ShowRecords{Kind::kPower, {.names = {"Ot*"}}, {}, {}, {}}),
               testing::AllOf(HasSubstr("Other"), Not(HasSubstr("One"))));
 }

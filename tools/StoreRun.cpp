@@ -1,9 +1,6 @@
 #include "tools/StoreRun.h"
 
 #include <array>
-#include <cmath>
-#include <cstdio>
-#include <ctime>
 #include <filesystem>
 #include <system_error>
 #include <variant>
@@ -65,21 +62,6 @@ ExitStatus follow(const StoreRun& run, const std::filesystem::path& directory,
 }
 
 }  // namespace
-
-std::string localTime(double seconds) {
-  const double whole = std::floor(seconds);
-  const auto milliseconds = static_cast<int>((seconds - whole) * 1000);
-  const auto time = static_cast<std::time_t>(whole);
-  std::tm fields{};
-  std::array<char, 64> date{};
-  if (localtime_r(&time, &fields) == nullptr ||
-      std::strftime(date.data(), date.size(), "%Y-%m-%d %H:%M:%S", &fields) == 0) {
-    return std::to_string(seconds);  // so far off that it has no date
-  }
-  std::array<char, 8> fraction{};
-  std::snprintf(fraction.data(), fraction.size(), ".%03d", milliseconds);
-  return std::string(date.data()) + fraction.data();
-}
 
 RecordFilter filterOf(const RecordSelection& selection) {
   RecordFilter filter;

@@ -48,7 +48,4 @@ platform::linux_::RecordFilter filterOf(const RecordSelection& selection);
 ExitStatus runOverStore(const StoreRun& run, const platform::linux_::RecordFilter& filter,
                         const StoreReading& reading);
 
-// A moment (seconds since 1970) in local time, to the millisecond.
-std::string localTime(double seconds);
-
 }  // namespace halvox::tools

@@ -6,15 +6,17 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <fstream>
 #include <memory>
 #include <vector>
 
-#include <rapidjson/error/en.h>
 #include <rapidjson/filereadstream.h>
 #include <rapidjson/reader.h>
 #include <rapidjson/stringbuffer.h>
 #include <rapidjson/writer.h>
 #include <sys/stat.h>
+
+#include "tools/JsonError.h"
 
 namespace halvox::tools {
 namespace {
@@ -237,9 +239,9 @@ bool readSummary(const std::string& path, const SummaryMessageHandler& handler,
     return false;
   }
   if (!result.IsError()) return true;
-  error = "is no summary: at byte " + std::to_string(result.Offset()) + ": " +
-          (summary.problem().empty() ? std::string(rapidjson::GetParseError_En(result.Code()))
-                                     : summary.problem());
+  std::ifstream text(path, std::ios::binary);
+  error = "is no summary: " +
+          describeJsonError(text, result.Offset(), result.Code(), summary.problem());
   return false;
 }
 

@@ -135,7 +135,8 @@ TEST_F(SummaryTest, BrokenFileIsToldAndTheOthersAreShown) {
   EXPECT_EQ(show({write(kName, kText), broken}), ExitStatus::kBadArguments);
 
   EXPECT_THAT(out_.str(), HasSubstr("org.example-player"));
-  EXPECT_THAT(errors_.str(), StartsWith("halvoxctl summary: " + broken + ": is no summary: at "));
+  EXPECT_THAT(errors_.str(),
+              StartsWith("halvoxctl summary: " + broken + ": is no summary: line 1, column "));
 }
 
 TEST_F(SummaryTest, MissingFilesAndDirectoriesAreErrors) {
@@ -157,7 +158,7 @@ TEST_F(SummaryTest, WhatIsNoSummaryIsSaid) {
   EXPECT_THAT(problemOf(R"([{"A": []}])"), HasSubstr("a message is no object"));
   EXPECT_THAT(problemOf(R"([{"A": {}, "B": {}}])"), HasSubstr("more than one message"));
   EXPECT_THAT(problemOf("[{\"A\": {\"b\": \"\xFF\"}}]"), HasSubstr("encoding"));
-  EXPECT_THAT(problemOf("[] x"), HasSubstr("byte 3"));
+  EXPECT_THAT(problemOf("[] x"), HasSubstr("line 1, column 4: "));
   EXPECT_THAT(problemOf(R"([{"A": {"b": )" + std::string(100'000, '[')), HasSubstr("too deep"));
 }
 

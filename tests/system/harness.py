@@ -202,19 +202,22 @@ class Follower:
     """A halvoxctl that shows stored records as they come, one JSON object a line."""
 
     def __init__(self, service, command):
+        words = [command] if isinstance(command, str) else command
         self._process = subprocess.Popen(
-            [*WITH_US, str(CTL), command, "--follow", "--json"], stdin=subprocess.DEVNULL,
+            [*WITH_US, str(CTL), *words, "--follow", "--json"], stdin=subprocess.DEVNULL,
             stdout=subprocess.PIPE, env={**os.environ, "HALVOX_CONFIG": str(service.config)})
         os.set_blocking(self._process.stdout.fileno(), False)
         self._bytes = b""
 
+    def so_far(self):
+        """All records that have been shown by now."""
+        self._bytes += self._process.stdout.read() or b""
+        return [json.loads(line) for line in self._bytes.decode().split("\n")[:-1]]
+
     def records(self, count):
         """All records so far, once there are that many."""
-        def shown():
-            self._bytes += self._process.stdout.read() or b""
-            lines = self._bytes.decode().split("\n")[:-1]
-            return lines if len(lines) >= count else None
-        return [json.loads(line) for line in wait_for(f"{count} records", shown)]
+        return wait_for(f"{count} records",
+                        lambda: len(shown := self.so_far()) >= count and shown)
 
     def leave(self):
         """Reads no more; the exit status with which the program ends then."""

@@ -89,8 +89,13 @@ void addLink(CommandSet& commands) {
                                .reach = CommandReach::kFiles},
                               request);
   addNumbers(link, "--session", request->ids, "Only messages of this session (-1: of none)");
-  addNumbers(link, "--category", request->categories, "Only messages of this category");
-  addNumbers(link, "--type", request->types, "Only messages of this type");
+  addEach(link, "--category", request->categories, parseCategory,
+          "Only messages of this category, such as Session_Playback; without a domain, as in "
+          "Playback, of all domains; name or number")
+      ->type_name("CATEGORY");
+  addEach(link, "--type", request->types, parseEventType,
+          "Only messages of this type, such as Start; name or number")
+      ->type_name("TYPE");
   addSelection(link, request->selection, "messages", "--service");
 }
 

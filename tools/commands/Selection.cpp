@@ -5,6 +5,7 @@
 
 #include "tools/Arguments.h"
 #include "tools/CommandSet.h"
+#include "tools/TimeText.h"
 
 namespace halvox::tools {
 namespace {
@@ -28,14 +29,20 @@ void addSelection(CLI::App& app, RecordSelection& selection, const char* records
   }
   addParsed(
       app, "--since", selection.since, parseTimeNow,
-      only + " since then: a date (RFC 3339), seconds since 1970, or an age (90s, 5m, 2h, 3d)")
+      only +
+          " since then: a time that a command printed, \"2026-11-21 22:44\", RFC 3339 with an "
+          "offset, today, yesterday, how long ago (90s, 5min, 2h, 3d, 1w, also -5min), or "
+          "@SECONDS since 1970")
       ->type_name("TIME");
-  addParsed(app, "--until", selection.until, parseTimeNow, only + " before then")
+  addParsed(app, "--until", selection.until, parseTimeNow,
+            only + " before then; TIME as for --since")
       ->type_name("TIME");
-  addParsed(app, "--last", selection.last, parseCount, "Only so many, the newest")->type_name("N");
+  addParsed(app, "--last", selection.last, parseCount,
+            "Only the newest N; 0 with --follow shows new ones only")
+      ->type_name("N");
   app.add_flag("--follow", selection.follow,
-               std::string("Go on showing ") + records +
-                   " as they come; begins with the last 10 unless --since or --last say otherwise");
+               std::string("Keep showing ") + records +
+                   " as they come; starts with the last 10 unless --since or --last is given");
   app.add_option("--database", selection.database,
                  "The store: a halvox.db or its directory (default: what the configuration names, "
                  "else the user's, $XDG_STATE_HOME/halvox or ~/.local/state/halvox, if there is "

@@ -64,7 +64,11 @@ void addNotify(CommandSet& commands) {
                                    .summary = "Post a notification to the service",
                                    .example = "halvoxctl notify com.tarno.halvox.reporting",
                                    .reach = CommandReach::kFiles});
-  notify.add_option("NAME", request->name, "The notification")->required();
+  notify
+      .add_option("NAME", request->name,
+                  "The notification: com.tarno.halvox.reporting or "
+                  "com.tarno.pavisk.spatial-audio-accessory-feature.changed")
+      ->required();
   notify
       .add_option("--directory", request->directory,
                   "Where the service looks for notifications (default: as its configuration says)")

@@ -1,0 +1,87 @@
+#include "tools/LinkNames.h"
+
+#include <algorithm>
+#include <optional>
+#include <string_view>
+
+#include <rapidjson/document.h>
+
+#include "client/Vocabulary.h"
+#include "platform/linux/store/RecordTables.h"
+
+namespace halvox::tools {
+namespace {
+
+using client::Category;
+using platform::linux_::StoredRecord;
+namespace store = platform::linux_;
+
+constexpr const char* kTag = "audiotag";
+constexpr Category kCategoryProper = 0xFFFF;
+
+Category categoryProperOf(const StoredRecord& message) {
+  return static_cast<Category>(message.number(store::kLinkCategory)) & kCategoryProper;
+}
+
+client::EventType typeOf(const StoredRecord& message) {
+  return static_cast<client::EventType>(message.number(store::kLinkType));
+}
+
+std::string tagOf(const StoredRecord& message) {
+  const std::string& payload = message.text(store::kLinkPayload);
+  rapidjson::Document document;
+  document.Parse<rapidjson::kParseIterativeFlag>(payload.data(), payload.size());
+  if (document.HasParseError() || !document.IsObject()) return {};
+  const auto tag = document.FindMember(kTag);
+  if (tag == document.MemberEnd() || !tag->value.IsString()) return {};
+  return {tag->value.GetString(), tag->value.GetStringLength()};
+}
+
+// What stands before the category proper in the text of a category: "Session_", "_" for a domain
+// that has no name, or nothing.
+std::string domainOf(Category category) {
+  const std::string name = client::categoryName(category);
+  return name.substr(0, name.size() - client::categoryName(category & kCategoryProper).size());
+}
+
+bool isDomain(std::string_view text) {
+  return text == "_" || std::ranges::any_of(client::domains(), [&](const auto& domain) {
+           return text == std::string(domain.name) + "_";
+         });
+}
+
+// The domain in the message's tag; nothing where the tag says something else than the numbers.
+std::string domainOf(const StoredRecord& message) {
+  const std::string tag = tagOf(message);
+  const std::string rest = client::categoryName(categoryProperOf(message)) +
+                           std::string(client::eventTypeName(typeOf(message)));
+  if (!tag.ends_with(rest)) return {};
+  const std::string domain = tag.substr(0, tag.size() - rest.size());
+  return isDomain(domain) ? domain : std::string();
+}
+
+}  // namespace
+
+std::string linkCategoryName(const StoredRecord& message) {
+  const Category category = categoryProperOf(message);
+  const std::string name = client::categoryName(category);
+  const bool isNamed = client::findCategory(name) == category;
+  return domainOf(message) + (isNamed ? name : std::to_string(category));
+}
+
+std::string linkTypeName(const StoredRecord& message) {
+  const std::string name(client::eventTypeName(typeOf(message)));
+  if (client::findEventType(name) == typeOf(message)) return name;
+  return std::to_string(message.number(store::kLinkType));
+}
+
+bool isOfCategory(const StoredRecord& message, std::span<const std::int64_t> categories) {
+  return categories.empty() || std::ranges::any_of(categories, [&](std::int64_t wanted) {
+           const auto category = static_cast<Category>(wanted);
+           const std::string domain = domainOf(category);
+           return (category & kCategoryProper) == categoryProperOf(message) &&
+                  (domain.empty() || domain == domainOf(message));
+         });
+}
+
+}  // namespace halvox::tools
