@@ -3,6 +3,7 @@
 import itertools
 import json
 import os
+import plistlib
 import re
 import shutil
 import subprocess
@@ -11,6 +12,7 @@ import unittest
 from pathlib import Path
 
 from harness import CTL, DEADLINE, Follower, Service, wait_for
+from tracing import interval
 
 COMPLETION = Path(__file__).resolve().parents[2] / "packaging/completions/halvoxctl"
 SCRIPT = """\
@@ -64,7 +66,9 @@ class JsonFailuresTest(unittest.TestCase):
         self.script = self.directory / "script"
         self.script.write_text("create 7\n")
         self.params = self.directory / "params.plist"
-        self.params.write_text("")
+        points = [interval("tick", 0x21040010, 0x21040014)]
+        self.params.write_bytes(plistlib.dumps(
+            {"Children": [{"Name": "T", "TraceType": "ktrace", "Children": points}]}))
 
     def failure(self, status, *arguments, **more):
         """The object that a failing command prints."""
