@@ -10,8 +10,8 @@ namespace halvox::tools {
 namespace {
 
 constexpr const char* kSessionNote =
-    "A session lives as long as the connection that made it: of its own, this command makes a "
-    "connection and ends it. Use 'halvoxctl run' or 'halvoxctl shell' for commands that belong "
+    "A session lives as long as the connection that made it, and a single command ends its "
+    "connection. Use 'halvoxctl run' or 'halvoxctl shell' for commands that belong "
     "together.";
 
 // What single arguments come to, for the request that is then made of them.
@@ -129,7 +129,7 @@ void addSend(CommandSet& commands) {
   const auto arguments = std::make_shared<Arguments>();
   CLI::App& app =
       commands.add({.name = "send",
-                    .summary = "Send a message to sessions, its own and those of others",
+                    .summary = "Send a message to sessions, also to those of other clients",
                     .example = "halvoxctl send --id 7 --category Session_Playback --type "
                                "Start '{\"sample_rate\": 48000}'"});
   addEach(app, "--id", arguments->ids, parseReporterID, "A session that the message is for")
@@ -179,10 +179,9 @@ void addRequestCommands(CommandSet& commands) {
   addBare<List>(commands, {.name = "list",
                            .summary = "List the reporter IDs of all sessions",
                            .example = "halvoxctl list --json"});
-  addBare<Kill>(commands,
-                {.name = "kill",
-                 .summary = "End the service at once, without an answer or any tidying up",
-                 .example = "halvoxctl kill"});
+  addBare<Kill>(commands, {.name = "kill",
+                           .summary = "End the service at once, without an answer or cleanup",
+                           .example = "halvoxctl kill"});
 }
 
 void addScriptRequests(CommandSet& commands) {

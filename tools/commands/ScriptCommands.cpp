@@ -12,8 +12,8 @@ namespace halvox::tools {
 namespace {
 
 constexpr const char* kScriptNote =
-    "The lines are as the arguments of halvoxctl, quoted as in a shell; a JSON object at the end "
-    "of a line needs no quotes. # begins a comment line.\nBesides the requests there are 'wait ID "
+    "Each line has the arguments of halvoxctl, quoted as in a shell; a JSON object at the end "
+    "of a line needs no quotes. # starts a comment.\nBesides the requests there are 'wait ID "
     "[SECONDS]' (for the answer to a start) and 'sleep SECONDS'.\nEnds at the first line that "
     "fails, with its status.";
 
@@ -51,7 +51,7 @@ void addScriptCommands(CommandSet& commands) {
                     .example = "printf 'create 7\\nstart 7\\nstop 7\\n' | halvoxctl run -",
                     .details = kScriptNote});
   run.add_option("FILE", script->file, "The file; \"-\" reads standard input")->required();
-  run.add_flag("--keep-going", script->keepGoing, "Go on behind lines that fail");
+  run.add_flag("--keep-going", script->keepGoing, "Continue after lines that fail");
   commands.onRun(
       run, [script] { return *script; }, runFile);
 

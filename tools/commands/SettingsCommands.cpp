@@ -34,16 +34,17 @@ void addPreferences(CommandSet& commands) {
       {.name = "preferences",
        .summary = "Show or change settings that the service follows while it runs",
        .example = "halvoxctl preferences set com.tarno.halvox device_name Kitchen",
-       .details = "A set or unset leaves everything else in the file as it is, comments too. "
-                  "Tables with lines of their own cannot be changed so; edit the file instead.\nA "
-                  "VALUE that begins with - comes behind a -- of its own.",
+       .details =
+           "A set or unset leaves everything else in the file as it is, comments too. "
+           "Tables with lines of their own cannot be changed this way; edit the file instead.\nPut "
+           "-- before a VALUE that begins with -.",
        .reach = CommandReach::kFiles});
   addParsed(preferences, "ACTION", request->action, parseAction, "get, set or unset")->required();
   preferences.add_option("DOMAIN", request->domain, "A domain, such as com.tarno.halvox")
       ->required();
-  preferences.add_option("KEY", request->key, "A key; to get all, none");
+  preferences.add_option("KEY", request->key, "A key; without one, get shows all keys");
   preferences.add_option("VALUE", request->value,
-                         "A TOML value; what is none is taken as a string");
+                         "A TOML value; anything else is taken as a string");
   preferences.add_flag("--string", request->isString, "Take VALUE as a string in any case");
   preferences.add_option("--user", request->user, "Whose settings (default: mobile)")
       ->type_name("USER");

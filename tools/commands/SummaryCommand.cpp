@@ -7,13 +7,14 @@ namespace halvox::tools {
 
 void addSummaryCommand(CommandSet& commands) {
   const auto request = std::make_shared<ShowSummaries>();
-  CLI::App& summary = commands.add({.name = "summary",
-                                    .summary = "Show what sessions of internal builds came to",
-                                    .example = "halvoxctl summary --last 5",
-                                    .details = "A single FILE is shown with its messages.",
-                                    .reach = CommandReach::kFiles});
+  CLI::App& summary =
+      commands.add({.name = "summary",
+                    .summary = "Show summaries of sessions, which internal builds write",
+                    .example = "halvoxctl summary --last 5",
+                    .details = "A single FILE is shown with its messages.",
+                    .reach = CommandReach::kFiles});
   auto* last = addParsed(summary, "--last", request->last, parseCount,
-                         "Without a FILE: so many, the newest (default: 10)");
+                         "Without a FILE: the newest N (default: 10)");
   last->type_name("N");
   summary
       .add_option("FILE", request->files, "Summary files (default: the newest of the service's)")

@@ -17,7 +17,7 @@ void addRecord(CommandSet& commands, CLI::App& trace) {
   record.add_option("--params", request->params, "The trace parameters file, a property list")
       ->type_name("FILE")
       ->required();
-  record.add_option("COMMAND", request->command, "The program and its arguments, behind --")
+  record.add_option("COMMAND", request->command, "The program and its arguments, after --")
       ->required();
   commands.onRun(
       record, [request] { return *request; },
@@ -29,7 +29,7 @@ void addRecord(CommandSet& commands, CLI::App& trace) {
 void addShow(CommandSet& commands, CLI::App& trace) {
   const auto request = std::make_shared<ShowTrace>();
   CLI::App& show = commands.addBelow(trace, {.name = "show",
-                                             .summary = "Show what a results file comes to",
+                                             .summary = "Show statistics of a results file",
                                              .example = "halvoxctl trace show tracing_results.ssj",
                                              .reach = CommandReach::kFiles});
   show.add_option("FILE", request->file, kFile)->required();
