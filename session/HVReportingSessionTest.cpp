@@ -1,6 +1,6 @@
 #include "session/HVReportingSession.h"
 
-#include <atomic>
+#include <chrono>
 #include <memory>
 #include <string>
 #include <thread>
@@ -372,30 +372,22 @@ TEST_F(HVReportingSessionTest, RepetitionsUnderAnotherCodeOfTheSameTextAreCharge
   EXPECT_EQ(account->use().bytes, 0U);
 }
 
-// Another thread never finds a history at a session that is not started: it comes after the flag is
-// set and goes before the flag is cleared. Whoever holds the history holds up its end, so the flag
-// is read where a wrong order would show.
-TEST_F(HVReportingSessionTest, AHistoryIsOnlyThereWhileTheSessionIsStarted) {
-  constexpr int kEnough = 2000;
+// Whoever holds the history holds up a start only when the session is marked as started.
+TEST_F(HVReportingSessionTest, StartSetsTheFlagBeforeItMakesTheHistory) {
   const auto session = makeSession();
-  platform_.log.setLevel(LogLevel::kError);
-  std::atomic<int> seen{0};
-  std::atomic<int> wrong{0};
-  const std::jthread reader([&](const std::stop_token& stop) {
-    while (!stop.stop_requested()) {
-      const auto history = session->nestedAggregatedPayloadData();
-      if (!history->has_value()) continue;
-      if (!session->started()) ++wrong;
-      ++seen;
+  std::jthread starter;
+  {
+    const auto history = session->nestedAggregatedPayloadData();
+    starter = std::jthread([session] { session->start(); });
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
+    while (!session->started() && std::chrono::steady_clock::now() < deadline) {
+      std::this_thread::yield();
     }
-  });
-
-  while (seen < kEnough) {
-    session->start();
-    session->stop();
+    EXPECT_TRUE(session->started());
+    EXPECT_FALSE(history->has_value());
   }
-
-  EXPECT_EQ(wrong, 0);
+  starter.join();
+  EXPECT_TRUE(session->nestedAggregatedPayloadData()->has_value());
 }
 
 // Runs under ThreadSanitizer: payloads are built from sessions on other threads.

@@ -1,6 +1,8 @@
 #include <algorithm>
 #include <memory>
+#include <semaphore>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -280,6 +282,34 @@ TEST_F(HVReportingSessionTracingTest, FailedStopClearsTheTrace) {
   EXPECT_EQ(session_->traceSession(), nullptr);
   EXPECT_NE(session_->traceConfig(), nullptr);
   EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidStop disk"});
+}
+
+// The end of a trace is the last thing that a stop waits for: from there on this thread holds the
+// history. The stop cannot take it, and the session stays marked as started all the while.
+TEST_F(HVReportingSessionTracingTest, StopClearsTheFlagWhenTheHistoryIsGone) {
+  constexpr int kRounds = 10;
+  constexpr int kYields = 50;
+  platform_.performanceTraces.completeAtStop("file:///one");
+  for (int round = 0; round < kRounds; ++round) {
+    session_->start();
+    std::binary_semaphore traceEnds{0};
+    std::binary_semaphore historyIsHeld{0};
+    platform_.dispatch.whenSignalled([&] {
+      traceEnds.release();
+      historyIsHeld.acquire();
+    });
+    const std::jthread stopper([session = session_] { session->stop(); });
+
+    traceEnds.acquire();
+    const auto history = session_->nestedAggregatedPayloadData();
+    historyIsHeld.release();
+
+    for (int turn = 0; turn < kYields; ++turn) {
+      ASSERT_TRUE(session_->started());
+      std::this_thread::yield();
+    }
+    EXPECT_TRUE(history->has_value());
+  }
 }
 
 TEST_F(HVReportingSessionTracingTest, CompletionWithAnErrorEndsTheWaitWithoutAURL) {

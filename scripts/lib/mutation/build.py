@@ -204,9 +204,10 @@ class Program:
         limit = ["prlimit", f"--as={MEMORY_LIMIT}", "--core=0", "--"] if shutil.which("prlimit") else []
         return [*limit, str(path), "--gtest_fail_fast", "--gtest_brief=1"]
 
-    def fails(self, path, directory):
+    def fails(self, path):
         """How a changed program fails: failed, crashed or timed out; None when it passes."""
-        status, output = run(self.test_command(path), directory, self.limit)
+        # Where it runs unchanged: a compiler may have made the paths that tests read relative to it.
+        status, output = run(self.test_command(path), self._build, self.limit)
         if status is None:
             return "timed out", ""
         if status == 0:

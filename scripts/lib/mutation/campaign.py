@@ -6,7 +6,7 @@ import re
 import shutil
 import threading
 import time
-from concurrent.futures import ThreadPoolExecutor
+from concurrent.futures import CancelledError, ThreadPoolExecutor
 from dataclasses import dataclass
 
 from .mutants import mutants_of
@@ -74,6 +74,7 @@ class Campaign:
         self._jobs = jobs
         self._say = say
         self._lock = threading.Lock()
+        self._ending = threading.Event()
         self._number = 0
         self.outcomes = []
 
@@ -103,10 +104,17 @@ class Campaign:
 
     def _in_parallel(self, work, items):
         with ThreadPoolExecutor(self._jobs) as pool:
-            for done in [pool.submit(work, item) for item in items]:
-                done.result()
+            try:
+                for done in [pool.submit(work, item) for item in items]:
+                    done.result()
+            except BaseException:
+                self._ending.set()
+                pool.shutdown(cancel_futures=True)
+                raise
 
     def _record(self, mutant):
+        if self._ending.is_set():
+            raise CancelledError
         with self._lock:
             self._number += 1
             directory = self._tree.scratch(self._number)
@@ -139,7 +147,7 @@ class Campaign:
             path = directory / program.name
             if not program.link({one: objects[one] for one in wanted}, path):
                 return Outcome(mutant, NOT_COMPILED)
-            how, test = program.fails(path, directory)
+            how, test = program.fails(path)
             path.unlink()
             if how is not None:
                 return Outcome(mutant, KILLED, f"{how} {test or program.name}")
