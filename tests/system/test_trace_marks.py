@@ -6,8 +6,8 @@ import re
 import subprocess
 import unittest
 
+import isolation
 from harness import DEADLINE, Service, WITH_US, require, wait_for
-from tracing import give_up_root
 
 CREATE, START, STOP, DESTROY, SEND = 0x21044814, 0x21044818, 0x2104481C, 0x21044820, 0x21044824
 CREATED, STARTED, STOPPED, DESTROYED = 0x21044828, 0x2104482C, 0x21044830, 0x21044834
@@ -18,14 +18,14 @@ EVENT = re.compile(r"halvox:kdebug:.*\{ code = (0x[0-9A-F]+), arg1 = (\d+), arg2
 
 def setUpModule():
     require("lttng-sessiond", "lttng", "babeltrace2")
-    give_up_root()
+    isolation.enter()
 
 
 class MarkedService(Service):
     """A service whose trace points a tracer's daemon of its own records."""
 
     def __init__(self, config=""):
-        super().__init__(config)
+        super().__init__(config, command=[str(isolation.program("halvox-reportingd"))])
         home = self.directory / "home"
         home.mkdir()
         self.trace = self.directory / "trace"
