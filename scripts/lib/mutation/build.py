@@ -17,9 +17,12 @@ from pathlib import Path
 # What a test program of a mutant may take: a mutant that waits for ever counts as noticed.
 SHORTEST_LIMIT = 20.0  # seconds
 LIMIT_FACTOR = 10  # of the time that the program takes unchanged
+SLOW_TEST = 0.4  # seconds; such tests run when all others have passed
 MEMORY_LIMIT = 8 << 30  # bytes of address space
 COMPILE_LIMIT = 300.0
 
+# Freed and fresh memory holds this byte, so that what reads it is seen.
+_TEST_ENVIRONMENT = {"MALLOC_PERTURB_": "165"}
 _TEST = re.compile(r"^\s*halvox_test\(\s*(\w+)", re.MULTILINE)
 
 
@@ -91,7 +94,8 @@ class Tree:
         # Compiled for speed of compiling; warnings would only cost, since mutants may well have some.
         self._must("configuring", [
             "cmake", "-S", str(self.source), "-B", str(self.build), "-G", "Ninja",
-            "-DCMAKE_BUILD_TYPE=Debug", "-DCMAKE_CXX_FLAGS_DEBUG=-O0", "-DCMAKE_CXX_FLAGS=-w",
+            "-DCMAKE_BUILD_TYPE=Debug", "-DCMAKE_CXX_FLAGS_DEBUG=-O0",
+            "-DCMAKE_CXX_FLAGS=-w -D_GLIBCXX_ASSERTIONS",
             "-DCMAKE_EXE_LINKER_FLAGS=-fuse-ld=lld", "-DCMAKE_EXPORT_COMPILE_COMMANDS=ON"])
 
     def prepare(self):
@@ -104,11 +108,7 @@ class Tree:
         self._includes = self._read_includes()
         self.programs = {name: self._program(name) for name in names}
         for program in self.programs.values():
-            begin = time.monotonic()
-            status, output = run(program.test_command(program.path), self.build, COMPILE_LIMIT)
-            if status != 0:
-                raise BuildError(f"{program.name} fails without a mutant:\n{ending(output)}")
-            program.limit = max(SHORTEST_LIMIT, LIMIT_FACTOR * (time.monotonic() - begin))
+            program.measure()
 
     @staticmethod
     def _object_of(command):
@@ -178,6 +178,7 @@ class Program:
         self.name = name
         self.path = build / "bin" / name
         self.limit = SHORTEST_LIMIT
+        self._slow = []
         self._build = build
         self._link = link
 
@@ -199,15 +200,32 @@ class Program:
         status, _ = run(words, self._build, COMPILE_LIMIT)
         return status == 0
 
-    @staticmethod
-    def test_command(path):
-        limit = ["prlimit", f"--as={MEMORY_LIMIT}", "--core=0", "--"] if shutil.which("prlimit") else []
-        return [*limit, str(path), "--gtest_fail_fast", "--gtest_brief=1"]
+    def measure(self):
+        """Runs the program unchanged, to learn how long it takes and which tests are slow."""
+        begin = time.monotonic()
+        status, output = self._run(self.path, "*", COMPILE_LIMIT)
+        if status != 0:
+            raise BuildError(f"{self.name} fails without a mutant:\n{ending(output)}")
+        self.limit = max(SHORTEST_LIMIT, LIMIT_FACTOR * (time.monotonic() - begin))
+        times = re.findall(r"\[       OK \] (\S+).* \((\d+) ms\)", output)
+        self._slow = [test for test, milliseconds in times if int(milliseconds) > SLOW_TEST * 1000]
 
-    def fails(self, path):
-        """How a changed program fails: failed, crashed or timed out; None when it passes."""
+    @property
+    def has_slow_tests(self):
+        return bool(self._slow)
+
+    def _run(self, path, tests, limit):
+        command = ["prlimit", f"--as={MEMORY_LIMIT}", "--core=0", "--"] if shutil.which("prlimit") else []
+        command += [str(path), "--gtest_fail_fast", f"--gtest_filter={tests}"]
         # Where it runs unchanged: a compiler may have made the paths that tests read relative to it.
-        status, output = run(self.test_command(path), self._build, self.limit)
+        return run(command, self._build, limit, {**os.environ, **_TEST_ENVIRONMENT})
+
+    def fails(self, path, slow=False):
+        """How the quick or the slow tests of a changed program fail: failed, crashed or timed out,
+        and which; None when they pass."""
+        slow_ones = ":".join(self._slow)
+        tests = slow_ones if slow else f"-{slow_ones}" if slow_ones else "*"
+        status, output = self._run(path, tests, self.limit)
         if status is None:
             return "timed out", ""
         if status == 0:

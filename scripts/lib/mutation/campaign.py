@@ -134,7 +134,7 @@ class Campaign:
         changed = directory / mutant.file
         changed.parent.mkdir(parents=True)
         changed.write_text(mutant.apply(self._tree.text(mutant.file)))
-        objects = {}
+        objects, linked = {}, []
         for program in self._tree.programs_for(mutant.folder):
             wanted = self._tree.objects_with(mutant.file, program)
             for one in wanted:
@@ -148,9 +148,14 @@ class Campaign:
             if not program.link({one: objects[one] for one in wanted}, path):
                 return Outcome(mutant, NOT_COMPILED)
             how, test = program.fails(path)
-            path.unlink()
             if how is not None:
                 return Outcome(mutant, KILLED, f"{how} {test or program.name}")
+            linked.append((program, path))
+        for program, path in linked:
+            if program.has_slow_tests:
+                how, test = program.fails(path, slow=True)
+                if how is not None:
+                    return Outcome(mutant, KILLED, f"{how} {test or program.name}")
         return Outcome(mutant, SURVIVED)
 
 
