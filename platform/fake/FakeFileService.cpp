@@ -1,8 +1,18 @@
 #include "platform/fake/FakeFileService.h"
 
+#include <algorithm>
 #include <stdexcept>
 
 namespace halvox::platform {
+namespace {
+
+bool isFileName(const std::string& name) {
+  constexpr std::size_t kLongest = 255;
+  const bool hasOther = name.find('/') != std::string::npos || name.find('\0') != std::string::npos;
+  return !name.empty() && name != "." && name != ".." && !hasOther && name.size() <= kLongest;
+}
+
+}  // namespace
 
 class FakeJsonArrayFile final : public JsonArrayFile {
  public:
@@ -59,6 +69,7 @@ std::optional<Error> FakeFileService::createDirectory(std::string_view path,
                                                       std::uint32_t permissions) {
   step("directory " + std::string(path) + " " + std::to_string(permissions));
   const std::lock_guard lock(mutex_);
+  known_.emplace(path);
   if (directoryError_.has_value()) return directoryError_;
   directories_.emplace(path, permissions);  // one that exists stays as it is
   return std::nullopt;
@@ -80,6 +91,16 @@ void FakeFileService::step(std::string text) {
 std::optional<Error> FakeFileService::add(File file) {
   const std::lock_guard lock(mutex_);
   if (fileError_.has_value()) return fileError_;
+  if (!isFileName(file.name)) return Error{.description = "no name of a file: " + file.name};
+  const auto isInside = [&](const std::string& known) {
+    return (known + "/").starts_with(file.directory + "/");
+  };
+  if (std::ranges::none_of(known_, isInside)) {
+    return Error{.description = "no such directory: " + file.directory};
+  }
+  std::erase_if(files_, [&](const File& other) {
+    return other.directory == file.directory && other.name == file.name;
+  });
   files_.push_back(std::move(file));
   return std::nullopt;
 }

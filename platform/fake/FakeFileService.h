@@ -3,6 +3,7 @@
 #include <map>
 #include <mutex>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -28,7 +29,8 @@ class FakeFileService final : public FileService {
   explicit FakeFileService(Journal& journal) : journal_(journal) {}
 
   // From now on directories cannot be made, or files not be committed, for that reason; none: they
-  // can again.
+  // can again. A directory that cannot be made counts as being there, so that a test can tell the
+  // two failures apart.
   void setDirectoryError(std::optional<Error> error);
   void setFileError(std::optional<Error> error);
 
@@ -37,7 +39,7 @@ class FakeFileService final : public FileService {
   [[nodiscard]] std::vector<std::string> steps() const;
   // The permissions of each directory, by its path.
   [[nodiscard]] std::map<std::string, std::uint32_t> directories() const;
-  // The files that were committed, in that order.
+  // The files that were committed, in that order; of one name the last.
   [[nodiscard]] std::vector<File> files() const;
   std::optional<Error> createDirectory(std::string_view path, std::uint32_t permissions) override;
   std::unique_ptr<JsonArrayFile> createJsonArrayFile(std::string_view directory,
@@ -52,6 +54,7 @@ class FakeFileService final : public FileService {
   mutable std::mutex mutex_;
   std::optional<Error> directoryError_;
   std::optional<Error> fileError_;
+  std::set<std::string> known_;  // the directories that were asked for
   std::map<std::string, std::uint32_t> directories_;
   std::vector<File> files_;
   std::vector<std::string> steps_;

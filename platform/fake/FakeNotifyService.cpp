@@ -38,6 +38,10 @@ NotifyStatus FakeNotifyService::notify_register_dispatch(std::string_view name, 
   if (const auto failure = failures_.find(name); failure != failures_.end()) {
     return failure->second;
   }
+  if (name.empty() || name == "." || name == ".." || name.find('/') != std::string_view::npos ||
+      name.find('\0') != std::string_view::npos) {
+    return kInvalidName;
+  }
   token = static_cast<NotifyToken>(registrations_.size()) + 1;
   registrations_.push_back({std::string(name), token, std::move(queue), std::move(handler)});
   return 0;

@@ -14,6 +14,8 @@ namespace halvox::platform {
 // Notifications that the test posts. Tokens count from 1. Any thread may call.
 class FakeNotifyService final : public NotifyService {
  public:
+  static constexpr NotifyStatus kInvalidName = 1;  // of a registration
+
   // From now on registrations of that name fail with that status.
   void failRegistration(std::string_view name, NotifyStatus status);
   // Queues the handlers that are registered for that name, in the order of their registration.
