@@ -69,6 +69,9 @@ struct InterfaceMethod {
   std::string_view out;
   MethodEffect effect = MethodEffect::kHoldsNoMore;
   void (*invoke)(ExportedObject& object, Invocation&& invocation) = nullptr;
+  // How many reporter IDs a request names; null for a method that takes no list of them. The
+  // connection layer refuses a request that names more than it is configured for.
+  std::size_t (*reporterIDs)(std::span<const Value> arguments) = nullptr;
 };
 
 // A protocol that objects export. Made of constants; lives as long as the process.

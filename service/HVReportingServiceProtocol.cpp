@@ -22,10 +22,6 @@ using platform::Value;
 constexpr std::string_view kInterfaceName = "com.tarno.halvox.HVReportingServiceProtocol";
 constexpr std::string_view kObjectPath = "/com/tarno/halvox/reporting";
 constexpr std::string_view kInvalidArguments = "org.freedesktop.DBus.Error.InvalidArgs";
-constexpr std::string_view kLimitsExceeded = "org.freedesktop.DBus.Error.LimitsExceeded";
-// One message to so many sessions holds the others up for some hundredths of a second. Nobody has a
-// use for more: a message without a list reaches all active sessions.
-constexpr std::size_t kMaxReporterIDs = 10'000;
 
 HVReportingServiceProtocol& service(ExportedObject& object) {
   return static_cast<HVReportingServiceProtocol&>(object);
@@ -95,6 +91,11 @@ void invokeStart(ExportedObject& object, Invocation&& request) {
                                              boolReply(std::move(request.reply)));
 }
 
+std::size_t countReporterIDs(std::span<const Value> arguments) {
+  const Array lists = arguments[3].array();
+  return lists.empty() ? 0 : lists[0].array().size();
+}
+
 void invokeSendMessage(ExportedObject& object, Invocation&& request) {
   // There is no null on the wire: the list comes inside another, which is empty for none.
   const Array lists = request.arguments[3].array();
@@ -107,15 +108,7 @@ void invokeSendMessage(ExportedObject& object, Invocation&& request) {
   }
   HVReportingServiceProtocol::ReporterIDs reporters;
   if (!lists.empty()) {
-    const Array ids = lists[0].array();
-    if (ids.size() > kMaxReporterIDs) {
-      request.reply(Error{.description = "sendMessage: argument 4: more than " +
-                                         std::to_string(kMaxReporterIDs) + " reporter IDs",
-                          .name = std::string(kLimitsExceeded)},
-                    Value());
-      return;
-    }
-    reporters = reporterIDs(ids);
+    reporters = reporterIDs(lists[0].array());
   }
   service(object).sendMessage(request.arguments[0].dictionary(),
                               enumeration<AudioEventCategory>(request.arguments[1]),
@@ -163,7 +156,7 @@ constexpr std::array kMethods{
     InterfaceMethod{"getServiceNameForReporterID", "x", "q", kNoMore, invokeGetServiceName},
     InterfaceMethod{"setConfiguration", "a{sv}x", "b", kMore, invokeSetConfiguration},
     InterfaceMethod{"startReportingSessionForID", "x", "b", kMore, invokeStart},
-    InterfaceMethod{"sendMessage", "a{sv}uqaax", "", kMore, invokeSendMessage},
+    InterfaceMethod{"sendMessage", "a{sv}uqaax", "", kMore, invokeSendMessage, countReporterIDs},
     InterfaceMethod{"stopReportingSessionForID", "x", "b", kNoMore, invokeStop},
     InterfaceMethod{"destroyReportingSession", "x", "b", kNoMore, invokeDestroy},
     InterfaceMethod{"reporterIDValid", "x", "a{sv}", kNoMore, invokeReporterIDValid},

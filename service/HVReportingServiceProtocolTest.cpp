@@ -90,6 +90,8 @@ TEST_F(HVReportingServiceProtocolTest, AnEndlessListOfReporterIDsIsRefused) {
   ASSERT_EQ(call->replies().size(), 1U);
   ASSERT_TRUE(call->replies()[0].error.has_value());
   EXPECT_EQ(call->replies()[0].error->name, "org.freedesktop.DBus.Error.LimitsExceeded");
+  EXPECT_NE(call->replies()[0].error->description.find("message_reporter_ids = 10000"),
+            std::string::npos);
   EXPECT_EQ(platform_.dispatch.waitingJobs(), 0U);
 }
 

@@ -86,6 +86,13 @@ std::shared_ptr<FakeCall> FakeConnection::call(std::string_view method,
   }
   auto call = std::make_shared<FakeCall>(journal_, std::string(method));
   const std::shared_ptr<ExportedObject> object = object_;  // a request may end the connection
+  if (target.reporterIDs != nullptr && target.reporterIDs(arguments) > kMaxReporterIDs) {
+    call->add(Error{.description = "message_reporter_ids = " + std::to_string(kMaxReporterIDs) +
+                                   " is exceeded",
+                    .name = "org.freedesktop.DBus.Error.LimitsExceeded"},
+              Value());
+    return call;
+  }
   const DeliveryMark mark(*this, std::make_shared<std::shared_ptr<int>>(openRequests_));
   target.invoke(*object, {arguments, [call](const std::optional<Error>& error, const Value& value) {
                             call->add(error, value);

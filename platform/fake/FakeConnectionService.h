@@ -44,6 +44,8 @@ class FakeConnectionService;
 // until it is invalidated, and by the test.
 class FakeConnection final : public NSXPCConnection {
  public:
+  static constexpr std::size_t kMaxReporterIDs = 10'000;  // of one request, as by default
+
   FakeConnection(Journal& journal, ProcessID pid) : journal_(journal), pid_(pid) {}
 
   // Delivers a request to the exported object and returns it with the answers so far; later answers

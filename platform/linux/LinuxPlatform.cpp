@@ -31,6 +31,7 @@ ConnectionOptions connectionOptions(const Configuration& configuration) {
   options.messageTimeout = configuration.listener.messageTimeout;
   options.clientHistoryMegabytes = configuration.limits.clientHistoryMegabytes;
   options.clientSessions = configuration.limits.clientSessions;
+  options.messageReporterIDs = configuration.limits.messageReporterIDs;
   return options;
 }
 

@@ -102,6 +102,11 @@ class Hostile(unittest.TestCase):
                          if payload.get("fine") == signature]
                 self.assertEqual(taken, [])
 
+    def test_more_reporters_than_the_limit_are_refused_with_its_name(self):
+        with self.assert_error("org.freedesktop.DBus.Error.LimitsExceeded",
+                               "message_reporter_ids = 10000", "10001"):
+            self.client().send({"a": 1}, reporters=[7] * 10_001)
+
     def test_more_than_one_list_of_reporters(self):
         with self.assert_error(INVALID_ARGS, "sendMessage"):
             self.client().call("sendMessage", "a{sv}uqaax", {}, 4, 1, [[1], [2]])

@@ -25,6 +25,8 @@ std::string_view nameOf(Refusal refusal) {
       return "client_history_megabytes";
     case Refusal::kSessionLimit:
       return "client_sessions";
+    case Refusal::kReporterIDLimit:
+      return "message_reporter_ids";
     case Refusal::kTooLarge:
       return "message too large";
     case Refusal::kTooManyWaiting:

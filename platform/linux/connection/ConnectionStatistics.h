@@ -18,10 +18,11 @@ enum class Refusal : std::uint8_t {
   kUnsupportedValue,
   kHistoryLimit,
   kSessionLimit,
+  kReporterIDLimit,
   kTooLarge,
   kTooManyWaiting,
 };
-inline constexpr std::size_t kRefusalKinds = 9;
+inline constexpr std::size_t kRefusalKinds = 10;
 
 // The refusal as the statistics name it.
 std::string_view nameOf(Refusal refusal);

@@ -31,6 +31,7 @@ struct ConnectionOptions {
   std::chrono::milliseconds messageTimeout{60'000};
   std::uint64_t clientHistoryMegabytes = 256;  // 2^20 bytes each
   std::uint64_t clientSessions = 100'000;
+  std::uint64_t messageReporterIDs = 10'000;  // named by one request
   std::size_t maxFrameBytes = 32 * kMiB;
   EndSignals signals = EndSignals::kHandle;
   // Called on the I/O thread before the first delivery of a turn, after the last one, and once the

@@ -254,5 +254,20 @@ TEST(RefusalsTest, OnlyRequestsThatMakeSessionsAreRefusedPastTheSessionLimit) {
   EXPECT_TRUE(client.receive()->values[0].toBool());
 }
 
+TEST(RefusalsTest, RequestThatNamesMoreReportersThanTheLimitIsRefusedAndCounted) {
+  ServiceUnderTest service([](ConnectionOptions& options) { options.messageReporterIDs = 2; });
+  RawClient client(service.socketPath());
+  const std::array two = {Value(Array{1, 2})};
+  const std::array three = {Value(Array{1, 2, 3})};
+
+  client.authenticate(client.call("name", "ax", three) + client.call("name", "ax", two));
+
+  const auto refused = client.receive();
+  EXPECT_EQ(refused->errorName, standardError("LimitsExceeded"));
+  EXPECT_THAT(std::string(refused->values[0].string()),
+              HasSubstr("message_reporter_ids = 2 is exceeded: the message names 3"));
+  EXPECT_TRUE(client.receive()->values[0].toBool());
+}
+
 }  // namespace
 }  // namespace halvox::platform::linux_

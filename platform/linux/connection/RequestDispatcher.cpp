@@ -91,6 +91,10 @@ void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& fr
 void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& method) {
   if (method.effect != MethodEffect::kHoldsNoMore && isOverLimits(request, method)) return;
   if (!decode(request, method.in)) return;
+  if (namesTooManyReporters(request, method)) {
+    arguments_.clear();
+    return;
+  }
   statistics_.requestsDelivered.add();
   ClientConnection& client = request.client;
   const FlowControl::Cost cost{.requests = weightOf(method), .bytes = request.frameBytes};
@@ -126,6 +130,18 @@ bool RequestDispatcher::isOverLimits(const Request& request, const InterfaceMeth
     return true;
   }
   return false;
+}
+
+bool RequestDispatcher::namesTooManyReporters(const Request& request,
+                                              const InterfaceMethod& method) {
+  if (method.reporterIDs == nullptr) return false;
+  const std::size_t named = method.reporterIDs(arguments_);
+  if (named <= options_.messageReporterIDs) return false;
+  request.client.refuse(request.header(), Refusal::kReporterIDLimit, error_names::kLimitsExceeded,
+                        "message_reporter_ids = " + std::to_string(options_.messageReporterIDs) +
+                            " is exceeded: the message names " + std::to_string(named) +
+                            " reporter IDs");
+  return true;
 }
 
 void RequestDispatcher::answerStandard(const Request& request, const StandardMethod& method) {

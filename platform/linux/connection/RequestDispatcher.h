@@ -29,6 +29,7 @@ class RequestDispatcher {
 
   void deliver(const Request& request, const InterfaceMethod& method);
   [[nodiscard]] bool isOverLimits(const Request& request, const InterfaceMethod& method);
+  [[nodiscard]] bool namesTooManyReporters(const Request& request, const InterfaceMethod& method);
   void answerStandard(const Request& request, const StandardMethod& method);
   [[nodiscard]] bool decode(const Request& request, std::string_view signature);
   void refuseUnknown(const Request& request);

@@ -29,6 +29,9 @@ constexpr NumberRange kDays{1, 36'500};
 constexpr NumberRange kMegabytes{1, 1U << 20U};
 constexpr NumberRange kReplicas{1, 5};  // what JetStream takes
 constexpr NumberRange kSessions{1, 1'000'000'000};
+// One message to 10,000 sessions holds the others up for some hundredths of a second, one to the
+// greatest number for seconds.
+constexpr NumberRange kReporterIDs{1, 1'000'000};
 constexpr NumberRange kSnapshots{1, 10'000};
 
 const char* configurationVariable() {
@@ -163,6 +166,7 @@ void readLink(TableReader table, Configuration::Link& link) {
 void readLimits(TableReader table, Configuration::Limits& limits) {
   table.read("client_history_megabytes", kMegabytes, limits.clientHistoryMegabytes);
   table.read("client_sessions", kSessions, limits.clientSessions);
+  table.read("message_reporter_ids", kReporterIDs, limits.messageReporterIDs);
   table.finish();
 }
 

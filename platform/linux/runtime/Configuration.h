@@ -65,6 +65,7 @@ struct Configuration {
   struct Limits {
     std::uint64_t clientHistoryMegabytes = 256;
     std::uint64_t clientSessions = 100'000;
+    std::uint64_t messageReporterIDs = 10'000;  // message_reporter_ids
   };
 
   Listener listener;

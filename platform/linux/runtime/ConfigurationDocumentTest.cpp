@@ -108,6 +108,7 @@ TEST(ConfigurationDocumentTest, TheDefaultsOfThePageAreTheDefaults) {
   EXPECT_EQ(page.drivers.pipewire, none.drivers.pipewire);
   EXPECT_EQ(page.limits.clientHistoryMegabytes, none.limits.clientHistoryMegabytes);
   EXPECT_EQ(page.limits.clientSessions, none.limits.clientSessions);
+  EXPECT_EQ(page.limits.messageReporterIDs, none.limits.messageReporterIDs);
   EXPECT_EQ(page.logLevel, none.logLevel);
   EXPECT_EQ(page.logMemoryLevel, none.logMemoryLevel);
   EXPECT_EQ(page.keepSnapshots, none.keepSnapshots);

@@ -42,6 +42,9 @@ INSTANTIATE_TEST_SUITE_P(
         MistakeCase{"Negative", "[limits]\nclient_sessions = -5",
                     "2:19: limits.client_sessions: expected an integer from 1 to 1000000000, "
                     "found -5"},
+        MistakeCase{"TooManyReporterIDs", "[limits]\nmessage_reporter_ids = 1000001",
+                    "2:24: limits.message_reporter_ids: expected an integer from 1 to 1000000, "
+                    "found 1000001"},
         MistakeCase{"Fraction", "[storage]\nmax_megabytes = 1.5",
                     "2:17: storage.max_megabytes: expected an integer from 1 to 1048576, found "
                     "1.5"},

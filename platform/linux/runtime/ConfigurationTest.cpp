@@ -118,6 +118,7 @@ sink = "sqlite"
 [limits]
 client_history_megabytes = 12
 client_sessions = 34
+message_reporter_ids = 56
 [log]
 level = "debug"
 memory_level = "error"
@@ -136,6 +137,7 @@ keep_snapshots = 3
   EXPECT_EQ(configuration.analytics.wanted, (std::vector<std::string>{"a*", "b"}));
   EXPECT_EQ(configuration.limits.clientHistoryMegabytes, 12U);
   EXPECT_EQ(configuration.limits.clientSessions, 34U);
+  EXPECT_EQ(configuration.limits.messageReporterIDs, 56U);
   EXPECT_EQ(configuration.logLevel, LogLevel::kDebug);
   EXPECT_EQ(configuration.logMemoryLevel, LogLevel::kError);
   EXPECT_EQ(configuration.keepSnapshots, 3U);

@@ -60,6 +60,8 @@ void answerTrue(ExportedObject& object, Invocation&& invocation) {
   invocation.reply(std::nullopt, true);
 }
 
+std::size_t countNumbers(std::span<const Value> arguments) { return arguments[0].array().size(); }
+
 void list(ExportedObject& object, Invocation&& invocation) {
   objectOf(object);
   constexpr int kCount = 1000;
@@ -89,6 +91,7 @@ constexpr std::array kMethods = {
     InterfaceMethod{"busy", "x", "b", kNoMore, busy},
     InterfaceMethod{"create", "x", "b", MethodEffect::kMakesSession, answerTrue},
     InterfaceMethod{"grow", "", "b", kMore, answerTrue},
+    InterfaceMethod{"name", "ax", "b", kNoMore, answerTrue, countNumbers},
     InterfaceMethod{"list", "", "ax", kNoMore, list},
     InterfaceMethod{"pid", "", "u", kNoMore, pid},
 };

@@ -48,6 +48,7 @@ class TestObject final : public ExportedObject {
 //   busy x → b        true, once the test says so; not carried out before
 //   create x → b      true; makes a session
 //   grow → b          true; may hold more
+//   name ax → b       true; the numbers are reporter IDs
 //   list → ax         1000 numbers
 //   pid → u           the process that asks; 0 when no connection or request is current
 const NSXPCInterface& testInterface();
