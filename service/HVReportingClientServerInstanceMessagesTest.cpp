@@ -111,6 +111,17 @@ TEST_F(HVReportingClientServerInstanceMessagesTest, StampsHaveTheirTypes) {
   EXPECT_EQ(message.find("processuptime_ms")->numberKind(), NumberKind::kInt64);
 }
 
+TEST_F(HVReportingClientServerInstanceMessagesTest, StampsComeLastAlwaysInTheSameOrder) {
+  createAndStart(client_, 7);
+
+  send(client_, {7}, {{"processuptime_ms", 6}, {"a", 1}});
+
+  std::vector<std::string> keys;
+  for (const auto& entry : recorded(client_, 7)) keys.emplace_back(entry.key.text());
+  EXPECT_THAT(keys, ElementsAre("a", "hvreporting_timestamp", "systemuptime_sec",
+                                "processuptime_ms", "audiotag"));
+}
+
 TEST_F(HVReportingClientServerInstanceMessagesTest, StampsReplaceWhatTheClientSent) {
   createAndStart(client_, 7);
 

@@ -1,0 +1,64 @@
+#pragma once
+
+#include <memory>
+#include <string_view>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "platform/fake/FakePlatform.h"
+#include "service/HVReportingClientServerInstance.h"
+#include "service/HVReportingServiceDelegateProtocol.h"
+#include "service/ReportingQueue.h"
+
+namespace halvox {
+
+// The whole service as a client object sees it, without other clients. Tests override what they
+// look at.
+class TestDelegate : public HVReportingServiceDelegateProtocol {
+ public:
+  [[nodiscard]] const platform::Dictionary& getDefaults() const override { return defaults_; }
+  [[nodiscard]] platform::Message getFeaturesState() const override { return std::nullopt; }
+  [[nodiscard]] const Clients& getAllClients() const override { return clients; }
+  [[nodiscard]] bool isReportingEnabled() const override { return true; }
+  [[nodiscard]] Sessions getAllActiveReportingSessions() const override { return {}; }
+  [[nodiscard]] std::shared_ptr<HVReportingSession> findReportingSessionForID(
+      ReporterID /*reporterID*/) const override {
+    return nullptr;
+  }
+  void removeClient(const HVReportingClientServerInstance& /*client*/) override {}
+  [[nodiscard]] std::int64_t activeSessionCount() const override { return count_; }
+  void setActiveSessionCount(std::int64_t count) override { count_ = count; }
+  [[nodiscard]] DriverSnapShot getSnapShot() const override { return {}; }
+  void sendDriverLogsForSession(const std::shared_ptr<HVReportingSession>& /*session*/) override {}
+  void handleEventForVEK(const platform::Message& /*message*/, AudioEventCategory /*category*/,
+                         AudioEventType /*type*/,
+                         const std::shared_ptr<HVReportingSession>& /*session*/,
+                         std::string_view /*processName*/) override {}
+  void noteSessionChange(const HVReportingClientServerInstance& /*client*/,
+                         const std::shared_ptr<HVReportingSession>& /*session*/,
+                         SessionChange /*change*/) override {}
+
+  Clients clients;
+
+ private:
+  const platform::Dictionary defaults_;
+  std::int64_t count_ = 0;
+};
+
+// One client object of such a service.
+template <typename Delegate>
+class DelegateTest : public testing::Test {
+ protected:
+  DelegateTest() { createReportingQueue(); }
+  ~DelegateTest() override { platform_.dispatch.clear(); }
+
+  void run() { platform_.dispatch.runUntilIdle(); }
+
+  platform::FakePlatform platform_;
+  std::shared_ptr<Delegate> delegate_ = std::make_shared<Delegate>();
+  std::shared_ptr<HVReportingClientServerInstance> client_ =
+      std::make_shared<HVReportingClientServerInstance>(100, delegate_);
+};
+
+}  // namespace halvox
