@@ -1,8 +1,10 @@
 #pragma once
 
-#include <map>
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <memory>
 #include <mutex>
-#include <string>
 #include <vector>
 
 #include "platform/fake/Journal.h"
@@ -12,21 +14,29 @@ namespace halvox::platform {
 
 // Kernel traces whose events a test makes up. Its clock is like that of a machine: it did not begin
 // at tick 0, and a tick need not be a whole number of nanoseconds, so that the nanoseconds of a
-// difference are not the difference of the nanoseconds. At first a tick is one nanosecond. The
-// events of a session are delivered, and its completion called, on its queue when it is ended.
-// Notes each operation in the journal. Any thread may call.
+// difference are not the difference of the nanoseconds. At first a tick is one nanosecond. What
+// a session recorded is delivered, and its completion called, by a job of its queue after its end.
+// Notes in the journal each operation that has an effect. Any thread may call.
 class FakeKtraceService final : public KtraceService {
  public:
   // Does not own the journal, which must outlive it.
   explicit FakeKtraceService(Journal& journal) : journal_(journal) {}
 
-  // The events that each session will deliver, as far as its range goes.
+  // Has each session find these events, as far as its ranges go, before those that it recorded.
   void setEvents(std::vector<trace_point> events);
+  // A program emits this event now: the sessions that record keep it, as far as their ranges go.
+  void emit(const trace_point& event);
   void setNanosecondsPerTick(std::uint64_t nanoseconds) { setTimebase(nanoseconds, 1); }
   // So many ticks take so many nanoseconds; what is left of a nanosecond is cut off.
   void setTimebase(std::uint64_t nanoseconds, std::uint64_t ticks);
+  // From now on these fail with that error; 0 ends it.
   void failRange(int error);
   void failStart(int error);
+  // Is called by each start before it does anything else, on its thread: a tracer that takes its
+  // time. Must be set before the first start.
+  void setTracerDelay(std::function<void()> delay) { delay_ = std::move(delay); }
+  // The number of sessions that record now.
+  [[nodiscard]] std::size_t recordings() const;
 
   Session ktrace_session_create() override;
   void ktrace_set_completion_handler(const Session& session,
@@ -41,9 +51,16 @@ class FakeKtraceService final : public KtraceService {
       const Session& session, std::uint64_t timestamp) const override;
 
  private:
+  class FakeSession;
+
+  // The session while it is being set up; null otherwise.
+  static std::shared_ptr<FakeSession> settingUp(const Session& session);
+
   Journal& journal_;
+  std::function<void()> delay_;
   mutable std::mutex mutex_;
   std::vector<trace_point> events_;
+  std::vector<std::weak_ptr<FakeSession>> sessions_;
   std::uint64_t timebaseNanoseconds_ = 1;
   std::uint64_t timebaseTicks_ = 1;
   int rangeError_ = 0;

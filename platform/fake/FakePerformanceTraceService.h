@@ -1,28 +1,44 @@
 #pragma once
 
+#include <cstddef>
+#include <cstdint>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 #include <vector>
 
+#include "platform/dispatch.h"
 #include "platform/fake/Journal.h"
 #include "platform/performance_trace.h"
 
 namespace halvox::platform {
 
-// Performance traces whose course a test decides by calling the delegate of the newest one. Notes
-// each operation in the journal. Any thread may call.
+// Performance traces that record nothing. They go well unless a test says otherwise; delegates are
+// called by jobs of the service's own queue, so a test hears nothing before it pumps. Notes in the
+// journal what sessions are asked for. Any thread may call.
 class FakePerformanceTraceService final : public PerformanceTraceService {
  public:
-  // Does not own the journal, which must outlive it.
-  explicit FakePerformanceTraceService(Journal& journal) : journal_(journal) {}
+  // Owns neither; both must outlive it and its sessions.
+  FakePerformanceTraceService(Journal& journal, DispatchService& dispatch)
+      : journal_(journal), dispatch_(dispatch) {}
+
+  // From now on, with that description: no trace begins; recordings fail when they are stopped;
+  // finished traces cannot be saved. An empty one ends it.
+  void failStarts(std::string description);
+  void failStops(std::string description);
+  void failSaves(std::string description);
+  // From now on nothing is heard of starts and stops: the recorder stands still.
+  void hang();
+  // The URL of the traces that complete from now on; before, each has one of its own.
+  void completeAtStop(std::string url);
 
   // The delegate of the newest session; null when it has none.
   [[nodiscard]] std::shared_ptr<KQTraceSessionDelegate> delegate() const;
   // The templates that configurations were asked for.
   [[nodiscard]] std::vector<std::int32_t> templates() const;
-  // Whether a stop at once completes with that URL.
-  void completeAtStop(std::string url);
+  // The number of sessions that record now.
+  [[nodiscard]] std::size_t recordings() const;
 
   std::shared_ptr<KQTraceConfig> configWithTemplate(std::int32_t number) override;
   std::shared_ptr<KQTraceSession> initWithConfig(
@@ -31,11 +47,31 @@ class FakePerformanceTraceService final : public PerformanceTraceService {
  private:
   class Session;
 
+  // How a stopped recording turns out.
+  struct Outcome {
+    std::optional<Error> stopError{};
+    std::optional<Error> error{};  // of the whole
+    std::string url{};             // empty with an error
+  };
+  [[nodiscard]] std::shared_ptr<DispatchQueue> queue();
+  [[nodiscard]] std::optional<Error> begin();
+  [[nodiscard]] bool isHanging() const;
+  [[nodiscard]] Outcome end();
+  void giveUp();
+
   Journal& journal_;
+  DispatchService& dispatch_;
   mutable std::mutex mutex_;
+  std::shared_ptr<DispatchQueue> queue_;  // made when needed
   std::vector<std::int32_t> templates_;
   std::weak_ptr<Session> newest_;
-  std::optional<std::string> urlAtStop_;
+  std::string startFailure_;
+  std::string stopFailure_;
+  std::string saveFailure_;
+  bool hangs_ = false;
+  std::string url_;
+  std::size_t recordings_ = 0;
+  std::size_t completed_ = 0;
 };
 
 }  // namespace halvox::platform

@@ -57,7 +57,7 @@ struct FakePlatform {
   FakePreferenceService preferences;
   FakeIOReportService ioReport{journal};
   FakeKtraceService ktrace{journal};
-  FakePerformanceTraceService performanceTraces{journal};
+  FakePerformanceTraceService performanceTraces{journal, dispatch};
   FakePropertyListService propertyLists;
   FakeResultsFileService resultsFiles{journal};
   FakeDispatchService dispatch{clock};

@@ -1,7 +1,11 @@
+#include <cstdint>
 #include <functional>
+#include <memory>
 #include <utility>
 
+#include "platform/linux/Mutex.h"
 #include "platform/linux/tracing/TraceServices.h"
+#include "platform/services.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -9,11 +13,18 @@ namespace {
 constexpr int kNoTracer = 1;
 
 struct NoSession final : KtraceSession {
+  enum class State : std::uint8_t { kMade, kStarted, kEnded, kDestroyed };
+  State state = State::kMade;
   std::function<void()> completion;
   std::shared_ptr<DispatchQueue> queue;
 };
+using State = NoSession::State;
 
-NoSession& own(const KtraceService::Session& session) { return dynamic_cast<NoSession&>(*session); }
+// The session in that state; null when it is in another or there is none.
+std::shared_ptr<NoSession> own(const KtraceService::Session& session, State state) {
+  auto ours = std::dynamic_pointer_cast<NoSession>(session);
+  return ours != nullptr && ours->state == state ? ours : nullptr;
+}
 
 // Sessions that cannot be started, and complete when they are ended.
 class NoKtraceService final : public KtraceService {
@@ -21,7 +32,7 @@ class NoKtraceService final : public KtraceService {
   Session ktrace_session_create() override { return std::make_shared<NoSession>(); }
   void ktrace_set_completion_handler(const Session& session,
                                      std::function<void()> handler) override {
-    own(session).completion = std::move(handler);
+    if (const auto ours = own(session, State::kMade)) ours->completion = std::move(handler);
   }
   void ktrace_set_walltimes_enabled(const Session& /*session*/, bool /*enabled*/) override {}
   int ktrace_events_range(const Session& /*session*/, std::uint32_t /*low*/, std::uint32_t /*high*/,
@@ -29,37 +40,62 @@ class NoKtraceService final : public KtraceService {
     return kNoTracer;
   }
   int ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) override {
-    own(session).queue = std::move(queue);
+    const auto ours = own(session, State::kMade);
+    if (ours == nullptr || queue == nullptr) return kNoTracer;
+    ours->state = State::kStarted;
+    ours->queue = std::move(queue);
     return kNoTracer;
   }
   void ktrace_end(const Session& session, int /*reason*/) override {
-    const auto queue = std::exchange(own(session).queue, nullptr);
-    auto completion = std::exchange(own(session).completion, nullptr);
-    if (queue && completion) queue->async(JobWeight::kMayBlock, std::move(completion));
+    const auto ours = own(session, State::kStarted);
+    if (ours == nullptr) return;
+    ours->state = State::kEnded;
+    ours->queue->async(JobWeight::kMayBlock, [ours] {
+      // Taken out: the handler may destroy the session, which lets go of it.
+      if (const auto completion = std::exchange(ours->completion, nullptr)) completion();
+    });
   }
-  void ktrace_session_destroy(const Session& /*session*/) override {}
+  void ktrace_session_destroy(const Session& session) override {
+    const auto ours = std::dynamic_pointer_cast<NoSession>(session);
+    if (ours == nullptr) return;
+    ours->state = State::kDestroyed;
+    ours->completion = nullptr;
+  }
   [[nodiscard]] std::uint64_t ktrace_convert_timestamp_to_nanoseconds(
       const Session& /*session*/, std::uint64_t timestamp) const override {
     return timestamp;
   }
 };
 
-class NoTraceSession final : public KQTraceSession {
+class NoTraceSession final : public KQTraceSession,
+                             public std::enable_shared_from_this<NoTraceSession> {
  public:
+  explicit NoTraceSession(std::shared_ptr<DispatchQueue> queue) : queue_(std::move(queue)) {}
+
   void setDelegate(std::weak_ptr<KQTraceSessionDelegate> delegate) override {
+    const MutexLock lock(mutex_);
     delegate_ = std::move(delegate);
   }
   void startKQTrace() override {
-    const auto delegate = delegate_.lock();
-    if (delegate == nullptr) return;
-    delegate->kqTraceDidStart(Error{.domain = "com.tarno.halvox.tracing",
-                                    .code = kNoTracer,
-                                    .description = "LTTng is not in this build"});
+    queue_->async(JobWeight::kMayBlock, [self = shared_from_this()] {
+      const auto delegate = self->delegate();
+      if (delegate == nullptr) return;
+      delegate->kqTraceDidStart(Error{.domain = "com.tarno.halvox.tracing",
+                                      .code = kNoTracer,
+                                      .description = "LTTng is not in this build"});
+    });
   }
   void stopKQTrace() override {}
 
  private:
-  std::weak_ptr<KQTraceSessionDelegate> delegate_;
+  std::shared_ptr<KQTraceSessionDelegate> delegate() {
+    const MutexLock lock(mutex_);
+    return delegate_.lock();
+  }
+
+  const std::shared_ptr<DispatchQueue> queue_;
+  Mutex mutex_;
+  std::weak_ptr<KQTraceSessionDelegate> delegate_ HALVOX_GUARDED_BY(mutex_);
 };
 
 class NoPerformanceTraceService final : public PerformanceTraceService {
@@ -69,8 +105,26 @@ class NoPerformanceTraceService final : public PerformanceTraceService {
   }
   std::shared_ptr<KQTraceSession> initWithConfig(
       std::shared_ptr<KQTraceConfig> /*configuration*/) override {
-    return std::make_shared<NoTraceSession>();
+    return std::make_shared<NoTraceSession>(queue());
   }
+  // Lets go of the queue; after the queues have ended.
+  void close() {
+    const MutexLock lock(mutex_);
+    queue_.reset();
+  }
+
+ private:
+  std::shared_ptr<DispatchQueue> queue() {
+    const MutexLock lock(mutex_);
+    if (queue_ == nullptr) {
+      queue_ = platform::dispatch().createSerialQueue(
+          "Performance Trace", QualityOfService::kUtility, QueueThreading::kShared);
+    }
+    return queue_;
+  }
+
+  Mutex mutex_;
+  std::shared_ptr<DispatchQueue> queue_ HALVOX_GUARDED_BY(mutex_);  // made when needed
 };
 
 class NoTraceServices final : public TraceServices {
@@ -79,7 +133,7 @@ class NoTraceServices final : public TraceServices {
   PerformanceTraceService& performanceTraces() override { return performanceTraces_; }
   void open() override {}
   void stop() override {}
-  void close() override {}
+  void close() override { performanceTraces_.close(); }
   void abandon() override {}
   [[nodiscard]] std::string description() const override { return "none, LTTng not in this build"; }
 

@@ -15,6 +15,7 @@ constexpr UnitLog kLog(tracingCategory, "LttngKtraceService");
 
 constexpr int kNotStarted = 1;
 constexpr int kNoRange = 2;
+constexpr int kUnsuitable = 3;  // there is no session, or it is not being set up any more
 constexpr std::size_t kBatchEvents = 4096;
 
 // Events on their way to the queue. They are counted as dropped when they go undelivered: the queue
@@ -46,17 +47,19 @@ struct Range {
 
 }  // namespace
 
-// Belongs to its caller until it is ended, then to the thread that reads, then, batch by batch, to
-// the queue that it was started with.
+// Belongs to who sets it up until it is started, and then to the queue that it was started with.
+// The thread that reads has the recording and the clock between the end and the deliveries.
 class LttngKtraceSession final : public KtraceSession {
  public:
+  enum class State : std::uint8_t { kMade, kStarted, kEnded, kDestroyed };
+
+  State state = State::kMade;
   std::vector<Range> ranges;
   std::function<void()> completion;
   std::shared_ptr<DispatchQueue> queue;
   std::optional<LttngControl::Recording> recording;  // while it records
   TraceClock clock;
   bool hasWalltimes = false;
-  bool isEnded = false;
 
   [[nodiscard]] std::string filter() const {
     std::string text;
@@ -80,8 +83,12 @@ class LttngKtraceSession final : public KtraceSession {
 
 namespace {
 
-std::shared_ptr<LttngKtraceSession> own(const KtraceService::Session& session) {
-  return std::dynamic_pointer_cast<LttngKtraceSession>(session);
+using State = LttngKtraceSession::State;
+
+// The session in that state; null when it is in another or there is none.
+std::shared_ptr<LttngKtraceSession> own(const KtraceService::Session& session, State state) {
+  auto ours = std::dynamic_pointer_cast<LttngKtraceSession>(session);
+  return ours != nullptr && ours->state == state ? ours : nullptr;
 }
 
 }  // namespace
@@ -139,22 +146,26 @@ KtraceService::Session LttngKtraceService::ktrace_session_create() {
 
 void LttngKtraceService::ktrace_set_completion_handler(const Session& session,
                                                        std::function<void()> handler) {
-  own(session)->completion = std::move(handler);
+  if (const auto ours = own(session, State::kMade)) ours->completion = std::move(handler);
 }
 
 void LttngKtraceService::ktrace_set_walltimes_enabled(const Session& session, bool enabled) {
-  own(session)->hasWalltimes = enabled;
+  if (const auto ours = own(session, State::kMade)) ours->hasWalltimes = enabled;
 }
 
 int LttngKtraceService::ktrace_events_range(const Session& session, std::uint32_t low,
                                             std::uint32_t high, EventHandler handler) {
+  const auto ours = own(session, State::kMade);
+  if (ours == nullptr) return kUnsuitable;
   if (low > high) return kNoRange;
-  own(session)->ranges.push_back({low, high, std::move(handler)});
+  ours->ranges.push_back({low, high, std::move(handler)});
   return 0;
 }
 
 int LttngKtraceService::ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) {
-  const auto ours = own(session);
+  const auto ours = own(session, State::kMade);
+  if (ours == nullptr || queue == nullptr) return kUnsuitable;
+  ours->state = State::kStarted;
   ours->queue = std::move(queue);
   started_.add();
   if (ours->ranges.empty()) return 0;
@@ -171,8 +182,9 @@ int LttngKtraceService::ktrace_start(const Session& session, std::shared_ptr<Dis
 }
 
 void LttngKtraceService::ktrace_end(const Session& session, int /*reason*/) {
-  auto ours = own(session);
-  if (std::exchange(ours->isEnded, true)) return;
+  auto ours = own(session, State::kStarted);
+  if (ours == nullptr) return;
+  ours->state = State::kEnded;
   readingQueue()->async(JobWeight::kMayBlock, [this, ours = std::move(ours)] { finish(ours); });
 }
 
@@ -185,9 +197,9 @@ void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& sessi
     if (failure || !isRead) failed_.add();
     control_.discard(*session->recording);
   }
-  if (session->queue == nullptr) return;
   session->queue->async(JobWeight::kMayBlock, [session] {
-    if (session->completion) session->completion();
+    // Taken out: the handler may destroy the session, which lets go of its handlers.
+    if (const auto completion = std::exchange(session->completion, nullptr)) completion();
   });
 }
 
@@ -225,19 +237,24 @@ bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
 }
 
 void LttngKtraceService::ktrace_session_destroy(const Session& session) {
-  const auto ours = own(session);
-  if (!ours->isEnded && ours->recording.has_value()) {
-    ours->isEnded = true;
+  const auto ours = std::dynamic_pointer_cast<LttngKtraceSession>(session);
+  if (ours == nullptr || ours->state == State::kDestroyed) return;
+  // After the end the recording is with the thread that reads, which removes it.
+  const bool isRecording = ours->state == State::kStarted && ours->recording.has_value();
+  ours->state = State::kDestroyed;
+  if (isRecording) {
     static_cast<void>(control_.end(*ours->recording));
     control_.discard(*ours->recording);
   }
   // The handlers may refer to who made the session.
   ours->ranges.clear();
+  ours->completion = nullptr;
 }
 
 std::uint64_t LttngKtraceService::ktrace_convert_timestamp_to_nanoseconds(
     const Session& session, std::uint64_t timestamp) const {
-  return own(session)->clock.toNanoseconds(timestamp);
+  const auto ours = std::dynamic_pointer_cast<LttngKtraceSession>(session);
+  return ours == nullptr ? timestamp : ours->clock.toNanoseconds(timestamp);
 }
 
 }  // namespace halvox::platform::linux_
