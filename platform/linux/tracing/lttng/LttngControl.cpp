@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <bit>
 #include <cstring>
+#include <fstream>
 #include <span>
 #include <system_error>
 #include <utility>
@@ -95,6 +96,7 @@ LttngControl::Failure addEvent(lttng_handle* handle, RecordingPlan plan) {
 LttngControl::LttngControl(std::filesystem::path tracesDirectory)
     : tracesDirectory_(std::move(tracesDirectory)),
       scratchDirectory_(tracesDirectory_ / "scratch"),
+      recordingDirectory_(tracesDirectory_ / "recording"),
       daemon_(tracesDirectory_ / "lttng-sessiond") {}
 
 std::string LttngControl::namePrefix() const {
@@ -110,6 +112,7 @@ void LttngControl::removeLeftovers() {
   if (!isRecorded && !daemon_.isNoted()) return;
   daemon_.adopt(namePrefix());
   if (::lttng_session_daemon_alive() == 1) destroyTracerSessions(namePrefix());
+  std::filesystem::remove_all(recordingDirectory_, ignored);
   std::filesystem::remove_all(scratchDirectory_, ignored);
 }
 
@@ -124,7 +127,11 @@ LttngControl::Failure LttngControl::begin(const RecordingPlan& plan, Recording& 
   if (::lttng_session_daemon_alive() != 1) {
     if (auto failure = daemon_.start(namePrefix())) return failure;
   }
-  return setUp(plan, recording);
+  if (auto failure = setUp(plan, recording)) return failure;
+  // For those who wait for it; the recording does without.
+  std::filesystem::create_directories(recordingDirectory_, error);
+  std::ofstream(recordingDirectory_ / recording.name).close();
+  return std::nullopt;
 }
 
 LttngControl::Failure LttngControl::setUp(const RecordingPlan& plan, const Recording& recording) {
@@ -145,6 +152,8 @@ LttngControl::Failure LttngControl::setUp(const RecordingPlan& plan, const Recor
 
 LttngControl::Failure LttngControl::end(const Recording& recording) {
   const MutexLock lock(mutex_);
+  std::error_code ignored;
+  std::filesystem::remove(recordingDirectory_ / recording.name, ignored);
   const char* const name = recording.name.c_str();
   // Both wait until what was recorded is on the disk.
   Failure failure = check(::lttng_stop_tracing(name), "stop the session");
@@ -166,6 +175,7 @@ void LttngControl::close() {
     destroyTracerSessions(namePrefix());
   }
   std::error_code ignored;
+  std::filesystem::remove_all(recordingDirectory_, ignored);
   std::filesystem::remove_all(scratchDirectory_, ignored);
 }
 

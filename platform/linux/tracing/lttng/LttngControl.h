@@ -23,7 +23,9 @@ struct RecordingPlan {
 //
 // Sessions have names that start with the identity of the storage directory, which one service at a
 // time has open: whatever bears such a name when the service starts was left by one before it. Each
-// records into a directory of its own below "scratch" in the traces' directory.
+// records into a directory of its own below "scratch" in the traces' directory. While it does, an
+// empty file of its name is in "recording" beside that: whoever sees it knows that what is emitted
+// from now on is recorded.
 //
 // Any thread may call. Calls wait for the daemon, one at a time, because the control library is not
 // for several threads at once: this is the one lock here that is held while something else works.
@@ -48,7 +50,7 @@ class LttngControl {
   [[nodiscard]] Failure begin(const RecordingPlan& plan, Recording& recording);
   // Stops and destroys the session; what it recorded is then whole in its directory.
   [[nodiscard]] Failure end(const Recording& recording);
-  // Removes the directory.
+  // Removes what was recorded.
   void discard(const Recording& recording);
   // Destroys all our sessions, and ends the daemon if we started it and nobody else uses it.
   void close();
@@ -62,6 +64,7 @@ class LttngControl {
 
   const std::filesystem::path tracesDirectory_;
   const std::filesystem::path scratchDirectory_;
+  const std::filesystem::path recordingDirectory_;
   Mutex mutex_;
   SessionDaemon daemon_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t begun_ HALVOX_GUARDED_BY(mutex_) = 0;
