@@ -234,6 +234,7 @@ class HVReportingSession : public platform::KQTraceSessionDelegate,
   // Both do nothing unless tracing is switched on and this is a test session. The stop blocks until
   // what was traced is complete.
   void startTracing();
+  std::shared_ptr<TraceRunner> runnerForThisRun();
   void startFrameworkTrace();
   void stopTracing();
 

@@ -43,6 +43,12 @@ bool choosesRunner(const platform::Dictionary& configuration) {
   return type != nullptr && type->isIdenticalTo(HVReportingTraceTypeKtrace);
 }
 
+std::shared_ptr<TraceRunner> makeRunner(const TraceParams* params) {
+  auto runner = std::make_shared<TraceRunner>();
+  runner->createTraceFromTraceParams(params);
+  return runner;
+}
+
 // What follows the scheme of a file's URL.
 std::string_view pathOfURL(std::string_view url) {
   constexpr std::string_view kScheme = "file://";
@@ -64,10 +70,21 @@ void HVReportingSession::startTracing() {
   const std::string file = platform::describe(*path);
   kSessionLog.debug("Got the tracefile ", file, ", setting up trace");
   setupTracing(file);
-  if (const auto runner = traceRunner()) {
+  if (const auto runner = runnerForThisRun()) {
     setStartedTracing(true);
     runner->runTraces();
   }
+}
+
+// The one that was just set up. If the set-up failed, the parameters of an earlier run are traced
+// again, by a runner of their own, so that its results are those of this run alone. Null when there
+// are none.
+std::shared_ptr<TraceRunner> HVReportingSession::runnerForThisRun() {
+  const auto current = traceRunner();
+  if (current == nullptr || current->canRun()) return current;
+  auto fresh = makeRunner(traceParams().get());
+  tracing_.lock()->runner = fresh;
+  return fresh;
 }
 
 void HVReportingSession::setupTracing(const std::string& path) {
@@ -76,13 +93,12 @@ void HVReportingSession::setupTracing(const std::string& path) {
     return;
   }
   auto params = std::make_shared<const TraceParams>(TraceParamsParser(path).loadTraceParams());
-  auto runner = std::make_shared<TraceRunner>();
-  runner->createTraceFromTraceParams(params.get());
+  auto runner = makeRunner(params.get());
   {
     const auto tracing = tracing_.lock();
     tracing->fileName = path;
     tracing->params = std::move(params);
-    tracing->runner = std::move(runner);
+    tracing->runner.swap(runner);  // the former one goes without the lock
   }
   setStartedTracing(false);
   kSessionLog.info("Setting up tracing for ", serviceName());
@@ -91,12 +107,16 @@ void HVReportingSession::setupTracing(const std::string& path) {
 void HVReportingSession::startFrameworkTrace() {
   PerformanceTraceService& traces = platform::performanceTraces();
   auto config = traces.configWithTemplate(PerformanceTraceService::kStandardTemplate);
-  auto trace = traces.initWithConfig(config);
+  const auto trace = traces.initWithConfig(config);
+  auto former = trace;
   {
     const auto tracing = tracing_.lock();
     tracing->config = std::move(config);
-    tracing->session = trace;
+    tracing->session.swap(former);
   }
+  // One that was never stopped, because its stop chose the runner, ends with its last holder. What
+  // it still has to say is not about the new one.
+  if (former != nullptr) former->setDelegate({});
   trace->setDelegate(weak_from_this());
   setStartedTracing(true);
   trace->startKQTrace();
@@ -105,6 +125,7 @@ void HVReportingSession::startFrameworkTrace() {
 void HVReportingSession::stopTracing() {
   if (!isTracingOn() || !startedTracing() || serviceType() != AudioServiceType::kTest) return;
   setStartedTracing(false);
+  // The type may have changed since the start. A runner that does not record has nothing to stop.
   if (choosesRunner(configuration())) {
     if (const auto runner = traceRunner()) runner->stopTracingandProcessResults();
     return;

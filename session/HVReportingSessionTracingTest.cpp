@@ -42,6 +42,23 @@ class HVReportingSessionTracingTest : public testing::Test {
     session_->setConfiguration(Dictionary{{HVReportingTraceType, HVReportingTraceTypeKtrace},
                                           {HVReportingMeridelPlistFilePath, kFile}});
   }
+  void chooseFramework() {
+    session_->setConfiguration(Dictionary{{HVReportingTraceType, HVReportingTraceTypeArtrace}});
+  }
+  static Dictionary paramsOf(const char* name, const char* begin, const char* end) {
+    const Dictionary point{{"Name", name},
+                           {"Type", "Interval"},
+                           {"KTraceCodeBegin", begin},
+                           {"KTraceCodeEnd", end},
+                           {"EventsMatchedBy", "Thread"}};
+    return {{"Children", Array{Dictionary{{"Name", "T"}, {"Children", Array{point}}}}}};
+  }
+  void recordInterval(std::uint64_t begin, std::uint64_t end) {
+    platform_.ktrace.setEvents(
+        {{.timestamp = begin, .debugid = 0x21040010}, {.timestamp = end, .debugid = 0x21040014}});
+  }
+  // What the back-ends do by themselves.
+  void letRun() { platform_.dispatch.runUntilIdle(); }
   // The operations of both back-ends.
   Texts operations() const { return platform_.journal.texts(JournalKind::kNote); }
   // The lines of that level about traces, those of the start hook included.
@@ -187,10 +204,11 @@ TEST_F(HVReportingSessionTracingTest, NextRunMakesANewRunner) {
   session_->stop();
 }
 
-TEST_F(HVReportingSessionTracingTest, EmptyPathOfALaterRunRecordsWithTheRunnerThatIsThere) {
+TEST_F(HVReportingSessionTracingTest, EmptyPathOfALaterRunRecordsTheSameWithANewRunner) {
   chooseRunner();
   session_->start();
   const auto first = session_->traceRunner();
+  const auto params = session_->traceParams();
   session_->stop();
   session_->setConfiguration(Dictionary{{HVReportingMeridelPlistFilePath, ""}});
   forgetWhatHappened();
@@ -199,10 +217,42 @@ TEST_F(HVReportingSessionTracingTest, EmptyPathOfALaterRunRecordsWithTheRunnerTh
   EXPECT_TRUE(session_->startedTracing());
   session_->stop();
 
-  EXPECT_EQ(session_->traceRunner(), first);
+  EXPECT_NE(session_->traceRunner(), first);
+  EXPECT_EQ(session_->traceParams(), params);
+  EXPECT_EQ(session_->tracingFileName(), kFile);
   EXPECT_THAT(operations(), testing::Contains("ktrace start"));
   EXPECT_THAT(operations(), testing::Contains("ktrace destroy"));
   EXPECT_EQ(lines(LogLevel::kError, "hvrr"), Texts{"TracefileName empty. Failed to setup tracing"});
+}
+
+TEST_F(HVReportingSessionTracingTest, ResultsHoldTheValuesOfTheirOwnRunOnly) {
+  platform_.propertyLists.setFile(kFile, paramsOf("IO", "0x21040010", "0x21040014"));
+  chooseRunner();
+  recordInterval(10, 35);
+  session_->start();
+  session_->stop();
+  session_->setConfiguration(Dictionary{{HVReportingMeridelPlistFilePath, ""}});
+  recordInterval(100, 160);
+
+  session_->start();
+  session_->stop();
+
+  const auto files = platform_.resultsFiles.files();
+  ASSERT_EQ(files.size(), 2U);
+  ASSERT_EQ(files[0].measurements.size(), 1U);
+  EXPECT_EQ(files[0].measurements[0].value, 25);
+  ASSERT_EQ(files[1].measurements.size(), 1U);
+  EXPECT_EQ(files[1].measurements[0].value, 60);
+}
+
+TEST_F(HVReportingSessionTracingTest, RunnerAndParametersStayWithTheSessionAfterTheStop) {
+  chooseRunner();
+  session_->start();
+  const auto runner = session_->traceRunner();
+  session_->stop();
+
+  EXPECT_EQ(session_->traceRunner(), runner);
+  EXPECT_EQ(session_->traceParams()->name, "T");
 }
 
 // --- The framework ------------------------------------------------------------------------------
@@ -210,6 +260,7 @@ TEST_F(HVReportingSessionTracingTest, EmptyPathOfALaterRunRecordsWithTheRunnerTh
 TEST_F(HVReportingSessionTracingTest, FrameworkTraceEndsWithItsURL) {
   platform_.performanceTraces.completeAtStop("file:///traces/one");
   session_->start();
+  letRun();
   forgetWhatHappened();
 
   session_->stop();
@@ -243,8 +294,9 @@ TEST_F(HVReportingSessionTracingTest, CompletionForgetsTheTraceThenSignalsThenSt
 
 TEST_F(HVReportingSessionTracingTest, StartOfATraceIsToldInTheGeneralLogToo) {
   session_->start();
+  EXPECT_TRUE(lines(LogLevel::kInfo, "hvrt").empty());
 
-  platform_.performanceTraces.delegate()->kqTraceDidStart(std::nullopt);
+  letRun();
 
   EXPECT_EQ(lines(LogLevel::kInfo, "hvrt"), Texts{"Performance Trace Started"});
   ASSERT_EQ(lines(LogLevel::kDefault, "general").size(), 1U);
@@ -252,10 +304,10 @@ TEST_F(HVReportingSessionTracingTest, StartOfATraceIsToldInTheGeneralLogToo) {
 }
 
 TEST_F(HVReportingSessionTracingTest, FailedStartClearsTheTraceButStaysStarted) {
+  platform_.performanceTraces.failStarts("no recorder");
   session_->start();
-  const auto delegate = platform_.performanceTraces.delegate();
 
-  delegate->kqTraceDidStart(Error{.description = "no recorder"});
+  letRun();
 
   EXPECT_EQ(session_->traceSession(), nullptr);
   EXPECT_EQ(session_->traceConfig(), nullptr);
@@ -264,8 +316,9 @@ TEST_F(HVReportingSessionTracingTest, FailedStartClearsTheTraceButStaysStarted) 
 }
 
 TEST_F(HVReportingSessionTracingTest, StopAfterAFailedStartWaitsForWhatNeverComes) {
+  platform_.performanceTraces.failStarts("no recorder");
   session_->start();
-  platform_.performanceTraces.delegate()->kqTraceDidStart(Error{.description = "no recorder"});
+  letRun();
   forgetWhatHappened();
 
   // The fake throws where a thread would stand still for ever.
@@ -313,9 +366,8 @@ TEST_F(HVReportingSessionTracingTest, StopClearsTheFlagWhenTheHistoryIsGone) {
 }
 
 TEST_F(HVReportingSessionTracingTest, CompletionWithAnErrorEndsTheWaitWithoutAURL) {
+  platform_.performanceTraces.failSaves("not saved");
   session_->start();
-  platform_.performanceTraces.delegate()->kqTraceDidComplete("", 0,
-                                                             Error{.description = "not saved"});
 
   session_->stop();  // would stand still without the signal
 
@@ -325,7 +377,6 @@ TEST_F(HVReportingSessionTracingTest, CompletionWithAnErrorEndsTheWaitWithoutAUR
 
 TEST_F(HVReportingSessionTracingTest, BackEndIsChosenAgainAtTheStop) {
   session_->start();
-  platform_.performanceTraces.completeAtStop("file:///one");
   chooseRunner();  // the framework records, but now the runner is chosen, and there is none
   forgetWhatHappened();
 
@@ -333,6 +384,87 @@ TEST_F(HVReportingSessionTracingTest, BackEndIsChosenAgainAtTheStop) {
 
   EXPECT_TRUE(operations().empty());
   EXPECT_FALSE(session_->startedTracing());
+}
+
+TEST_F(HVReportingSessionTracingTest, FinishedRunnerIsNotStoppedInPlaceOfTheFrameworksTrace) {
+  chooseRunner();
+  session_->start();
+  session_->stop();
+  chooseFramework();
+  session_->start();
+  letRun();
+  chooseRunner();
+  forgetWhatHappened();
+
+  session_->stop();
+
+  EXPECT_TRUE(operations().empty());
+  EXPECT_FALSE(session_->started());
+  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_EQ(platform_.resultsFiles.files().size(), 1U);
+}
+
+TEST_F(HVReportingSessionTracingTest, ATraceThatNoStopEndedIsGivenUpForTheNextOne) {
+  session_->start();
+  letRun();
+  chooseRunner();
+  session_->stop();
+  EXPECT_EQ(platform_.performanceTraces.recordings(), 1U);
+  chooseFramework();
+
+  session_->start();
+  letRun();
+  EXPECT_EQ(platform_.performanceTraces.recordings(), 1U);
+  session_->stop();
+
+  EXPECT_EQ(platform_.performanceTraces.recordings(), 0U);
+}
+
+TEST_F(HVReportingSessionTracingTest, NothingIsHeardOfATraceThatWasReplaced) {
+  platform_.performanceTraces.failStarts("no recorder");
+  session_->start();
+  chooseRunner();
+  session_->stop();
+  chooseFramework();
+  session_->start();  // both starts are still to come
+  const auto second = session_->traceSession();
+  platform_.performanceTraces.failStarts("");
+
+  letRun();
+
+  EXPECT_EQ(session_->traceSession(), second);
+  EXPECT_EQ(lines(LogLevel::kInfo, "hvrt"), Texts{"Performance Trace Started"});
+  session_->stop();
+}
+
+TEST_F(HVReportingSessionTracingTest, StopOfTheFrameworkWhileTheRunnerRecordsWaitsForATrace) {
+  chooseRunner();
+  session_->start();
+  letRun();
+  chooseFramework();
+
+  // There is none, so none completes: the wait has no end, on purpose.
+  EXPECT_THROW(session_->stop(), std::logic_error);
+
+  EXPECT_TRUE(session_->started());
+}
+
+TEST_F(HVReportingSessionTracingTest, NothingRecordsForASessionThatIsGone) {
+  for (const bool isRunner : {true, false}) {
+    isRunner ? chooseRunner() : chooseFramework();
+    session_->start();
+    letRun();
+    EXPECT_EQ(platform_.ktrace.recordings() + platform_.performanceTraces.recordings(), 1U);
+    session_->setServiceType(AudioServiceType::kHaptics);
+    session_->stop();
+
+    session_ = std::make_shared<HVReportingSession>(ReporterID{8},
+                                                    HVReportingSession::ProcessIdentifiers{12});
+    letRun();
+
+    EXPECT_EQ(platform_.ktrace.recordings() + platform_.performanceTraces.recordings(), 0U);
+    session_->setServiceType(AudioServiceType::kTest);
+  }
 }
 
 // --- Hooks --------------------------------------------------------------------------------------
@@ -377,6 +509,8 @@ TEST_F(HVReportingSessionTracingTest, StopWaitsForTheTraceBehindTheLinkBeforeThe
   session_->sendMessage(Dictionary{{"a", 1}}, AudioEventCategory::kPlayback, AudioEventType::kStart,
                         nullptr);
   forgetWhatHappened();
+
+  platform_.performanceTraces.hang();
 
   EXPECT_THROW(session_->stop(), std::logic_error);  // stands still in the wait
 

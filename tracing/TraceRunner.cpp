@@ -1,12 +1,13 @@
 #include "tracing/TraceRunner.h"
 
 #include <algorithm>
+#include <atomic>
 #include <cstdlib>
-#include <optional>
 #include <string>
 #include <utility>
 
 #include "platform/files.h"
+#include "platform/ktrace.h"
 #include "platform/process.h"
 #include "platform/results_file.h"
 #include "platform/services.h"
@@ -30,18 +31,79 @@ constexpr std::size_t kExpectedEvents = 10'000;
 
 }  // namespace
 
+// How many traces have completed, with a signal for each.
+struct TraceRunner::Completions {
+  std::atomic<std::uint32_t> count{0};  // read after the signal, which orders it
+  const std::shared_ptr<platform::DispatchSemaphore> signals =
+      platform::dispatch().createSemaphore(0);
+};
+
+// One trace while it is recorded. Belongs to the runner until it starts, then to the runner's queue
+// until it has completed. A recording that was set up must be torn down, by its completion or by
+// whoever gives it up: only then is it certain that no handler, which leads here, is called.
+class TraceRunner::Recording {
+ public:
+  Recording(std::string name, Trace::Kind kind, std::shared_ptr<Completions> completions)
+      : trace_(std::move(name), kind), completions_(std::move(completions)) {
+    events_.reserve(kExpectedEvents);
+  }
+
+  [[nodiscard]] Trace& trace() { return trace_; }
+
+  void setupTracing() {
+    platform::KtraceService& ktrace = platform::ktrace();
+    session_ = ktrace.ktrace_session_create();
+    ktrace.ktrace_set_completion_handler(session_, [this] { tracingCompletionHandler(); });
+    ktrace.ktrace_set_walltimes_enabled(session_, true);
+  }
+  void subscribe() {
+    const int range = platform::ktrace().ktrace_events_range(
+        session_, kFirstIdentifier, kLastIdentifier,
+        [this](const platform::trace_point& event) { events_.push_back(event); });
+    if (range != 0) kLog.error("Could not set up ktrace range, error: ", range);
+  }
+  void startTracing(const std::shared_ptr<platform::DispatchQueue>& queue) {
+    const int start = platform::ktrace().ktrace_start(session_, queue);
+    if (start != 0) kLog.error("Could not start ktrace session, error: ", start);
+  }
+  void stopTracing() {
+    constexpr int kNoReason = 0;
+    platform::ktrace().ktrace_end(session_, kNoReason);
+  }
+  void tracingCompletionHandler() {
+    if (trace_.isKernelTrace()) {
+      trace_.processTracepoints(session_, events_);
+      tearDownTracing();
+    }
+    completions_->count.fetch_add(1, std::memory_order_relaxed);
+    completions_->signals->signal();
+  }
+  void tearDownTracing() {
+    platform::ktrace().ktrace_session_destroy(std::exchange(session_, nullptr));
+  }
+
+ private:
+  Trace trace_;
+  const std::shared_ptr<Completions> completions_;
+  platform::KtraceService::Session session_;  // null: not set up, or torn down
+  TraceData::Events events_;
+};
+
 TraceRunner::TraceRunner()
     : queue_(platform::dispatch().createSerialQueue(
           // A stop waits for it on the reporting queue, so it must not run after what gives way.
           kQueueLabel, platform::QualityOfService::kUserInteractive,
           platform::QueueThreading::kOwnThread)),
-      completion_(platform::dispatch().createSemaphore(0)) {}
+      started_(platform::dispatch().createSemaphore(0)),
+      completions_(std::make_shared<Completions>()) {}
 
-// A runner can go while it records, when its session is replaced by another without a stop. What
-// still records has handlers that lead here.
+// A runner can go while it records: when its session is replaced by another without a stop, or is
+// no test any more when it stops. Its queue ends the recordings, behind starts that still wait for
+// the tracer, because whoever lets go of a session must not wait.
 TraceRunner::~TraceRunner() {
-  for (const auto& [trace, session] : sessions_) {
-    if (session != nullptr) platform::ktrace().ktrace_session_destroy(session);
+  if (state_ != State::kRecording) return;
+  for (const auto& recording : recordings_) {
+    queue_->async(platform::JobWeight::kMayBlock, [recording] { recording->tearDownTracing(); });
   }
 }
 
@@ -52,85 +114,61 @@ void TraceRunner::createTraceFromTraceParams(const TraceParams* params) {
     kLog.notice("Attempted to add nullptr to trace runner");
     return;
   }
-  auto trace = std::make_unique<Trace>(params->name, params->type == TraceType::kKernelTrace
-                                                         ? Trace::Kind::kKernelTrace
-                                                         : Trace::Kind::kSignpost);
+  if (state_ != State::kMade) return;
+  auto recording = std::make_shared<Recording>(
+      params->name,
+      params->type == TraceType::kKernelTrace ? Trace::Kind::kKernelTrace : Trace::Kind::kSignpost,
+      completions_);
   for (const TraceDataParams& point : params->tracePoints) {
-    trace->addTraceDataToCollect(std::make_unique<TraceInterval>(
+    recording->trace().addTraceDataToCollect(std::make_unique<TraceInterval>(
         point.name,
         TraceIntervalCodes{
             .begin = point.beginCode, .end = point.endCode, .matchByThread = point.matchByThread}));
   }
-  events_[trace.get()].reserve(kExpectedEvents);
-  traces_.push_back(std::move(trace));
+  recordings_.push_back(std::move(recording));
 }
 
 void TraceRunner::runTraces() {
-  kLog.info("Number of traces to perform: ", traces_.size());
-  for (const auto& trace : traces_) {
-    kLog.info("Performing trace : ", trace->name());
-    if (!trace->isKernelTrace()) continue;
-    kLog.info("Setting up tracing: ", trace->name());
-    setupTracing(*trace);
-    kLog.info("Starting tracing: ", trace->name());
-    startTracing(*trace);
+  if (state_ != State::kMade) return;
+  state_ = State::kRecording;
+  kLog.info("Number of traces to perform: ", recordings_.size());
+  for (const auto& recording : recordings_) {
+    const Trace& trace = recording->trace();
+    kLog.info("Performing trace : ", trace.name());
+    if (!trace.isKernelTrace()) continue;
+    kLog.info("Setting up tracing: ", trace.name());
+    recording->setupTracing();
+    kLog.info("Starting tracing: ", trace.name());
+    recording->subscribe();
+    // The tracer may take seconds to start.
+    queue_->async(platform::JobWeight::kMayBlock, [recording, queue = queue_, started = started_] {
+      recording->startTracing(queue);
+      started->signal();
+    });
   }
-}
-
-void TraceRunner::setupTracing(Trace& trace) {
-  platform::KtraceService& ktrace = platform::ktrace();
-  const auto session = ktrace.ktrace_session_create();
-  sessions_[&trace] = session;
-  // The runner goes after the completion, or destroys the session before it goes.
-  ktrace.ktrace_set_completion_handler(session,
-                                       [this, &trace] { tracingCompletionHandler(trace); });
-  ktrace.ktrace_set_walltimes_enabled(session, true);
-}
-
-void TraceRunner::startTracing(Trace& trace) {
-  platform::KtraceService& ktrace = platform::ktrace();
-  const auto& session = sessions_.at(&trace);
-  TraceData::Events& events = events_.at(&trace);
-  const int range = ktrace.ktrace_events_range(
-      session, kFirstIdentifier, kLastIdentifier,
-      [&events](const platform::trace_point& event) { events.push_back(event); });
-  if (range != 0) kLog.error("Could not set up ktrace range, error: ", range);
-  const int start = ktrace.ktrace_start(session, queue_);
-  if (start != 0) kLog.error("Could not start ktrace session, error: ", start);
-}
-
-void TraceRunner::stopTracing(Trace& trace) {
-  constexpr int kNoReason = 0;
-  platform::ktrace().ktrace_end(sessions_.at(&trace), kNoReason);
-}
-
-void TraceRunner::tracingCompletionHandler(Trace& trace) {
-  if (trace.isKernelTrace()) {
-    trace.processTracepoints(sessions_.at(&trace), events_.at(&trace));
-    tearDownTracing(trace);
-  }
-  completed_.fetch_add(1, std::memory_order_relaxed);
-  completion_->signal();
-}
-
-void TraceRunner::tearDownTracing(Trace& trace) {
-  platform::ktrace().ktrace_session_destroy(std::exchange(sessions_.at(&trace), nullptr));
 }
 
 void TraceRunner::stopTracingandProcessResults() {
-  for (const auto& trace : traces_) {
-    kLog.info("Tearing down trace :  ", trace->name());
-    queue_->async(platform::JobWeight::kMayBlock, [this, &trace = *trace] {
-      if (trace.isKernelTrace()) {
-        stopTracing(trace);
+  if (state_ != State::kRecording) return;
+  state_ = State::kFinished;
+  // So that what goes wrong at the start is logged before the stop.
+  for (const auto& recording : recordings_) {
+    if (recording->trace().isKernelTrace()) started_->wait();
+  }
+  for (const auto& recording : recordings_) {
+    Trace& trace = recording->trace();
+    kLog.info("Tearing down trace :  ", trace.name());
+    queue_->async(platform::JobWeight::kMayBlock, [recording] {
+      if (recording->trace().isKernelTrace()) {
+        recording->stopTracing();
       } else {
-        tracingCompletionHandler(trace);
+        recording->tracingCompletionHandler();
       }
     });
-    completion_->wait();
-    if (trace->isKernelTrace()) results_[trace.get()] = trace->getResults();
-    kLog.info("Completed trace.... ", completed_.load(std::memory_order_relaxed), ",   ",
-              traces_.size(), " ");
+    completions_->signals->wait();
+    if (trace.isKernelTrace()) results_[&trace] = trace.getResults();
+    kLog.info("Completed trace.... ", completions_->count.load(std::memory_order_relaxed), ",   ",
+              recordings_.size(), " ");
   }
   writeScoresheet();
 }

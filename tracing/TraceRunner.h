@@ -1,15 +1,12 @@
 #pragma once
 
-#include <atomic>
 #include <cstdint>
 #include <map>
 #include <memory>
 #include <string_view>
-#include <utility>
 #include <vector>
 
 #include "platform/dispatch.h"
-#include "platform/ktrace.h"
 #include "tracing/Trace.h"
 #include "tracing/TraceParams.h"
 
@@ -21,14 +18,18 @@ inline constexpr std::string_view HVReportingTracingLogsDirectory =
 // Records a kernel trace for each trace that it was given, and writes what was measured to a
 // results file.
 //
-//   made --createTraceFromTraceParams--> with traces --runTraces--> recording
-//        --stopTracingandProcessResults--> results written; not used again
+//   made --createTraceFromTraceParams--> made --runTraces--> recording
+//        --stopTracingandProcessResults--> finished
 //
-// The caller is one thread at a time. Events and completions come on the runner's own serial queue,
-// and the caller waits for them at the end, so what they write is read only after it is complete.
-// Owned by its session; when it goes unstopped, its recordings end and nothing is written. Failures
-// are logged and the rest goes on; only a results file that cannot be opened ends the process, with
-// exit status 1, and that is intended.
+// A runner records once: what does not suit its state does nothing, so a finished runner cannot be
+// stopped again and one that never ran has nothing to stop. Traces of the same parameters are
+// recorded again by another runner.
+//
+// The caller is one thread at a time. What waits for the tracer is done by the runner's own serial
+// queue, where events and completions come too; the caller waits for it only when it stops. Owned
+// by its session; when it goes while it records, its queue ends the recordings and nothing is
+// written. Failures are logged and the rest goes on; only a results file that cannot be opened ends
+// the process, with exit status 1, and that is intended.
 class TraceRunner {
  public:
   TraceRunner();
@@ -38,32 +39,33 @@ class TraceRunner {
 
   // Adds a trace with an interval for each trace point, whatever its kind. Null is logged.
   void createTraceFromTraceParams(const TraceParams* params);
-  // Starts to record all kernel traces; signposts are not started.
+  // Starts to record all kernel traces; signposts are not started. Never blocks: the recording
+  // begins, or its failure is logged, a little later.
   void runTraces();
   // Ends the traces, one strictly after the other, and writes the results file. Blocks until every
   // trace has completed, without a time limit.
   void stopTracingandProcessResults();
 
-  [[nodiscard]] std::size_t getNumTraces() const { return traces_.size(); }
+  // Whether it has not run yet.
+  [[nodiscard]] bool canRun() const { return state_ == State::kMade; }
+  [[nodiscard]] std::size_t getNumTraces() const { return recordings_.size(); }
   [[nodiscard]] static std::uint32_t getResultsVersion();
 
  private:
+  struct Completions;
+  class Recording;
   using Results = std::map<const Trace*, Trace::Results>;
+  enum class State : std::uint8_t { kMade, kRecording, kFinished };
 
-  void setupTracing(Trace& trace);
-  void startTracing(Trace& trace);
-  void stopTracing(Trace& trace);
-  void tracingCompletionHandler(Trace& trace);
-  void tearDownTracing(Trace& trace);
   static void printTraceResults(const Results::value_type& entry);
   void writeScoresheet() const;
 
-  std::vector<std::unique_ptr<Trace>> traces_;
-  std::atomic<std::uint32_t> completed_{0};  // read after the semaphore, which orders it
-  std::shared_ptr<platform::DispatchQueue> queue_;
-  std::shared_ptr<platform::DispatchSemaphore> completion_;
-  std::map<const Trace*, platform::KtraceService::Session> sessions_;  // null: torn down
-  std::map<const Trace*, TraceData::Events> events_;
+  State state_ = State::kMade;
+  const std::shared_ptr<platform::DispatchQueue> queue_;
+  const std::shared_ptr<platform::DispatchSemaphore> started_;  // signalled after each start
+  const std::shared_ptr<Completions> completions_;              // shared with the recordings
+  // Shared with the jobs of the queue, which may still need them when the runner has gone.
+  std::vector<std::shared_ptr<Recording>> recordings_;
   Results results_;
 };
 

@@ -1,5 +1,6 @@
 #include "tracing/TraceRunner.h"
 
+#include <algorithm>
 #include <memory>
 #include <string>
 #include <vector>
@@ -32,6 +33,11 @@ class TraceRunnerTest : public testing::Test {
   void add(const TraceParams& one) { runner_.createTraceFromTraceParams(&one); }
   void record(std::vector<platform::trace_point> events) {
     platform_.ktrace.setEvents(std::move(events));
+  }
+  // Runs, and lets the tracer start.
+  void run() {
+    runner_.runTraces();
+    platform_.dispatch.runUntilIdle();
   }
   void runAndStop() {
     runner_.runTraces();
@@ -90,9 +96,10 @@ TEST_F(TraceRunnerTest, TracesRunOnAQueueOfTheirOwnWithAThreadOfItsOwn) {
   add(params("Startup"));
   runAndStop();
 
-  // What stops a trace may wait for the tracer.
+  // What starts and stops a trace may wait for the tracer.
   EXPECT_EQ(platform_.dispatch.weights("Tracing Queue"),
             (std::vector<platform::JobWeight>{platform::JobWeight::kMayBlock,
+                                              platform::JobWeight::kMayBlock,
                                               platform::JobWeight::kMayBlock}));
 }
 
@@ -165,7 +172,7 @@ TEST_F(TraceRunnerTest, FailedStartIsLoggedAndTheTraceCompletesWithoutResults) {
 TEST_F(TraceRunnerTest, TracesAreStoppedOneAfterTheOther) {
   add(params("First"));
   add(params("Second"));
-  runner_.runTraces();
+  run();
   platform_.journal.clear();
 
   runner_.stopTracingandProcessResults();
@@ -245,6 +252,96 @@ TEST_F(TraceRunnerTest, DirectoryIsMadeForEverybody) {
   EXPECT_EQ(directories.begin()->second, 0777U);
 }
 
+// --- A runner records once -----------------------------------------------------------------------
+
+TEST_F(TraceRunnerTest, RunnerThatHasFinishedIsNotStoppedAgain) {
+  add(params("Startup"));
+  record({event(kBegin, 10), event(kEnd, 35)});
+  runAndStop();
+  platform_.journal.clear();
+
+  runner_.stopTracingandProcessResults();
+
+  EXPECT_TRUE(platform_.journal.texts().empty());
+  EXPECT_EQ(onlyFile().measurements.size(), 1U);
+}
+
+TEST_F(TraceRunnerTest, RunnerThatNeverRanIsNotStopped) {
+  add(params("Startup"));
+
+  runner_.stopTracingandProcessResults();
+
+  EXPECT_TRUE(platform_.journal.texts().empty());
+  EXPECT_TRUE(platform_.resultsFiles.files().empty());
+  EXPECT_TRUE(runner_.canRun());
+}
+
+TEST_F(TraceRunnerTest, RunnerRunsOnce) {
+  add(params("Startup"));
+  runAndStop();
+  platform_.journal.clear();
+
+  runner_.runTraces();
+  add(params("Late"));
+
+  EXPECT_TRUE(platform_.journal.texts().empty());
+  EXPECT_EQ(runner_.getNumTraces(), 1U);
+  EXPECT_FALSE(runner_.canRun());
+}
+
+TEST_F(TraceRunnerTest, RunnerThatRecordsDoesNotRunAgain) {
+  add(params("Startup"));
+  run();
+  platform_.journal.clear();
+
+  run();
+  add(params("Late"));
+
+  EXPECT_TRUE(platform_.journal.texts().empty());
+  runner_.stopTracingandProcessResults();
+  EXPECT_EQ(platform_.resultsFiles.files().size(), 1U);
+}
+
+// --- A start that takes its time -----------------------------------------------------------------
+
+TEST_F(TraceRunnerTest, TracerIsStartedByTheTracingQueue) {
+  add(params("Startup"));
+  bool hasStarted = false;
+  platform_.ktrace.setTracerDelay([&] { hasStarted = true; });
+
+  runner_.runTraces();
+
+  EXPECT_FALSE(hasStarted);
+  EXPECT_EQ(platform_.dispatch.weights("Tracing Queue").size(), 1U);
+  platform_.dispatch.runUntilIdle();
+  EXPECT_TRUE(hasStarted);
+}
+
+TEST_F(TraceRunnerTest, StopWaitsForTheStartAndIsLoggedAfterIt) {
+  add(params("Startup"));
+  platform_.ktrace.failStart(5);
+  runner_.runTraces();
+
+  runner_.stopTracingandProcessResults();
+
+  const Texts all = platform_.journal.texts();
+  const auto failed = std::ranges::find(all, "Could not start ktrace session, error: 5");
+  EXPECT_NE(std::find(failed, all.end(), "Tearing down trace :  Startup"), all.end());
+}
+
+TEST_F(TraceRunnerTest, RunnerThatGoesBeforeTheTracerHasStartedLeavesNoRecording) {
+  auto runner = std::make_unique<TraceRunner>();
+  const TraceParams one = params("Startup");
+  runner->createTraceFromTraceParams(&one);
+  runner->runTraces();
+
+  runner.reset();
+  platform_.dispatch.runUntilIdle();
+
+  EXPECT_EQ(platform_.ktrace.recordings(), 0U);
+  EXPECT_EQ(platform_.journal.texts().back(), "ktrace destroy");
+}
+
 // --- Failures and early ends --------------------------------------------------------------------
 
 TEST_F(TraceRunnerTest, DirectoryThatCannotBeMadeIsLoggedAndTheFileIsTried) {
@@ -274,11 +371,14 @@ TEST_F(TraceRunnerTest, RunnerThatGoesUnstoppedDestroysItsRecordings) {
   runner->createTraceFromTraceParams(&one);
   runner->createTraceFromTraceParams(&one);
   runner->runTraces();
+  platform_.dispatch.runUntilIdle();
   platform_.journal.clear();
 
   runner.reset();
+  platform_.dispatch.runUntilIdle();
 
   EXPECT_EQ(platform_.journal.texts(), (Texts{"ktrace destroy", "ktrace destroy"}));
+  EXPECT_EQ(platform_.ktrace.recordings(), 0U);
   EXPECT_TRUE(platform_.resultsFiles.files().empty());
 }
 
@@ -291,6 +391,7 @@ TEST_F(TraceRunnerTest, RunnerThatWasStoppedDestroysNothingMore) {
   platform_.journal.clear();
 
   runner.reset();
+  platform_.dispatch.runUntilIdle();
 
   EXPECT_TRUE(platform_.journal.texts().empty());
 }
