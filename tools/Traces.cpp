@@ -3,12 +3,17 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <memory>
+#include <optional>
+#include <set>
 #include <string>
+#include <system_error>
+#include <thread>
 #include <utility>
 #include <variant>
 
@@ -38,6 +43,9 @@ constexpr std::uint32_t kFirstCode = 0x21040000;
 constexpr std::uint32_t kLastCode = 0x2104408A;
 // The stop is answered when the trace has been read back.
 constexpr std::chrono::minutes kStopWithin{10};
+// The service gives a tracer that does not answer up after ten seconds.
+constexpr std::chrono::seconds kRecordsWithin{15};
+constexpr std::chrono::milliseconds kLookEvery{5};
 
 using platform::Dictionary;
 using Row = std::array<std::string, 6>;
@@ -142,6 +150,38 @@ std::pair<ino_t, std::int64_t> identityOf(const fs::path& file) {
   return {status.st_ino, status.st_mtim.tv_sec * 1'000'000'000 + status.st_mtim.tv_nsec};
 }
 
+using Names = std::set<std::string>;
+
+// The recordings of the service that run now. None when that cannot be seen from here.
+std::optional<Names> recordings(const fs::path& storage) {
+  Names names;
+  std::error_code error;
+  for (const auto& entry : fs::directory_iterator(storage / "traces/recording", error)) {
+    names.insert(entry.path().filename());
+  }
+  if (error && error != std::errc::no_such_file_or_directory) return std::nullopt;
+  return names;
+}
+
+// Waits until there is a recording that was not there before, because the start is answered while
+// the tracer still gets ready. False when none begins.
+bool recordsSoon(const fs::path& storage, const Names& before) {
+  const auto deadline = std::chrono::steady_clock::now() + kRecordsWithin;
+  while (std::chrono::steady_clock::now() < deadline) {
+    const auto now = recordings(storage);
+    if (!now.has_value() || !std::ranges::includes(before, *now)) return true;
+    std::this_thread::sleep_for(kLookEvery);
+  }
+  return false;
+}
+
+bool isTracingOn(const platform::linux_::Configuration& configuration) {
+  const auto domain = configuration.features.find("Acoustat");
+  if (domain == configuration.features.end()) return false;
+  const auto feature = domain->second.find("Tracing");
+  return feature != domain->second.end() && feature->second;
+}
+
 // A session of the service that is traced from its start to its stop.
 class TracedSession {
  public:
@@ -222,10 +262,10 @@ std::string runProgram(std::vector<std::string> command) {
 ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options, std::ostream& out,
                        std::ostream& errors) {
   const Complaint complain("trace record", options.form(), out, errors);
-  const auto configuration = serviceConfiguration(complain);
-  if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
-  const fs::path results =
-      std::get<platform::linux_::Configuration>(configuration).storage.root / kResultsFile;
+  const auto loaded = serviceConfiguration(complain);
+  if (const auto* status = std::get_if<ExitStatus>(&loaded)) return *status;
+  const auto& configuration = std::get<platform::linux_::Configuration>(loaded);
+  const fs::path results = configuration.storage.root / kResultsFile;
   const std::string params = fs::absolute(request.params).string();
   const ParamsFindings found = checkParams(params);
   for (const std::string& reason : found.reasons) {
@@ -239,9 +279,14 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
       std::get<std::string>(socket),
       std::max<std::chrono::milliseconds>(options.timeout, kStopWithin));
   if (!opened) return complain(ExitStatus::kNoService, opened.failure->message);
+  const fs::path& storage = configuration.storage.directory;
+  const Names earlier = recordings(storage).value_or(Names());
   TracedSession session(std::move(*opened.value));
   if (const std::string failure = session.start(params); !failure.empty()) {
     return complain(ExitStatus::kRefused, failure);
+  }
+  if (isTracingOn(configuration) && !recordsSoon(storage, earlier)) {
+    return complain(ExitStatus::kRefused, "the service does not record; its log says why");
   }
   const std::string ofProgram = runProgram(request.command);
   if (const std::string failure = session.stop(); !failure.empty()) {
