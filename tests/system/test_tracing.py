@@ -15,8 +15,9 @@ from pathlib import Path
 
 from harness import DEADLINE, WITH_US, require, stop_process, wait_for
 from isolation import program
-from tracing import (POINTS, REPORTER, THREADS, TracedService, children_of, interval,
-                     is_running, require_tracer, start_session, traced_session, waits_for_processor,
+from tracing import (POINTS, REPORTER, THREADS, TracedService, children_of, interval, is_running,
+                     require_tracer, restart_session, start_session, traced_session,
+                     waits_for_processor,
                      wait_for_results)
 
 PAIRS = 50
@@ -31,7 +32,6 @@ class KernelTraceTest(unittest.TestCase):
     def test_results_hold_what_the_program_measured(self):
         with TracedService() as service:
             with traced_session(service):
-                wait_for("the trace to run", service.scratch)
                 measured = service.run_client("intervals", PAIRS)
             values = wait_for_results(service)["values"]
 
@@ -53,7 +53,6 @@ class KernelTraceTest(unittest.TestCase):
     def test_matching_by_process_takes_events_of_any_thread(self):
         with TracedService() as service:
             with traced_session(service):
-                wait_for("the trace to run", service.scratch)
                 measured = service.run_client("intervals", 1)
             values = wait_for_results(service)["values"]
 
@@ -64,7 +63,6 @@ class KernelTraceTest(unittest.TestCase):
     def test_codes_outside_the_range_are_not_recorded(self):
         with TracedService() as service:
             with traced_session(service):
-                wait_for("the trace to run", service.scratch)
                 service.run_client("intervals", 10)
             values = wait_for_results(service)["values"]
 
@@ -79,7 +77,6 @@ class KernelTraceTest(unittest.TestCase):
     def test_nothing_is_left_of_a_trace(self):
         with TracedService() as service:
             with traced_session(service):
-                wait_for("the trace to run", service.scratch)
                 self.assertIn("halvox-", service.sessions())
                 daemon = service.daemon()
                 service.run_client("intervals", 1)
@@ -131,7 +128,6 @@ class KernelTraceTest(unittest.TestCase):
     def test_service_that_was_killed_is_cleaned_up_after(self):
         with TracedService() as service:
             client = start_session(service)
-            wait_for("the trace to run", service.scratch)
             daemon = service.daemon()
             service.stop(signal.SIGKILL)
             client.close()
@@ -211,7 +207,7 @@ class KernelTraceTest(unittest.TestCase):
 
     def test_without_the_feature_nothing_is_traced(self):
         with TracedService(switch="false") as service:
-            with traced_session(service):
+            with traced_session(service, records=False):
                 pass
 
             self.assertIsNone(service.daemon())
@@ -237,7 +233,6 @@ class KernelTraceTest(unittest.TestCase):
         events = 1_000_000
         with TracedService() as service:
             with traced_session(service):
-                wait_for("the trace to run", service.scratch)
                 took = service.run_client("flood", events, 200_000)["nanoseconds"] / 1e9
                 begin = os.times().elapsed
                 waited_before = waits_for_processor(service.process.pid)
@@ -257,6 +252,57 @@ class KernelTraceTest(unittest.TestCase):
             if not os.environ.get("HALVOX_SANITIZE"):
                 self.assertLess(elapsed - waited, 10)
                 self.assertLess(peak / 1024, 300)
+
+
+    def test_second_run_holds_its_own_values_only(self):
+        with TracedService() as service:
+            with traced_session(service) as client:
+                service.run_client("intervals", 3)
+                client.stop(REPORTER)
+                self.assertEqual(len(wait_for_results(service)["values"]["Shared"]), THREADS * 3)
+                client.configure({"HVReportingMeridelPlistFilePath": ""}, REPORTER)
+                restart_session(service, client)
+                service.run_client("intervals", 2)
+            values = service.results()["values"]
+
+            self.assertEqual(service.log().count("TracefileName empty. Failed to setup tracing"), 1)
+            self.assertEqual(len(values["Shared"]), THREADS * 2)
+            self.assertEqual(len(values["Own0"]), 2)
+
+
+class ForgottenTraceTest(unittest.TestCase):
+    """Traces that no stop ends, because the session has become another's kind meanwhile."""
+
+    def assert_nothing_records_once_released(self, service, client):
+        self.assertIn("halvox-", service.sessions())
+        client.destroy(REPORTER)
+        wait_for("the recording to end", lambda: "halvox-" not in service.sessions())
+        wait_for("the scratch trace to go", lambda: not service.scratch())
+        client.close()
+
+    def test_performance_trace_of_a_session_that_became_a_runners(self):
+        with TracedService() as service:
+            client = start_session(service, trace_type=None)
+            wait_for("its start", lambda: "Performance Trace Started" in service.log())
+            client.configure({"HVReportingTraceType": "ktrace"}, REPORTER)
+            client.stop(REPORTER)
+            self.assert_nothing_records_once_released(service, client)
+
+    def test_performance_trace_of_a_session_that_is_no_test_any_more(self):
+        with TracedService() as service:
+            client = start_session(service, trace_type=None)
+            wait_for("its start", lambda: "Performance Trace Started" in service.log())
+            client.set_type(5, REPORTER)
+            client.stop(REPORTER)
+            self.assert_nothing_records_once_released(service, client)
+
+    def test_kernel_trace_of_a_session_that_is_no_test_any_more(self):
+        with TracedService() as service:
+            client = start_session(service)
+            client.set_type(5, REPORTER)
+            client.stop(REPORTER)
+            self.assert_nothing_records_once_released(service, client)
+            self.assertIsNone(service.results())
 
 
 class ToolTest(unittest.TestCase):
@@ -371,7 +417,6 @@ class PerformanceTraceTest(unittest.TestCase):
     def test_trace_becomes_an_archive_that_other_tools_read(self):
         with TracedService() as service:
             with traced_session(service, trace_type=None):
-                wait_for("the trace to run", service.scratch)
                 wait_for("its start", lambda: "Performance Trace Started" in service.log())
                 service.run_client("intervals", 2)
             completed = "Performance Trace Completed: "

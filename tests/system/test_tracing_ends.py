@@ -17,7 +17,6 @@ class EndOfServiceTest(unittest.TestCase):
     def start_trace(self, service):
         """A session that is traced; gives its client and the daemon with all that it started."""
         client = start_session(service)
-        wait_for("the trace to run", service.scratch)
         daemon = service.daemon()
         self.assertTrue(is_running(daemon))
         return client, [daemon, *(pid for pid, _ in children_of(daemon))]

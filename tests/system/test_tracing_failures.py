@@ -27,7 +27,7 @@ class NoTracerTest(unittest.TestCase):
             service.stop()
             service.use_only()
             service.start()
-            with traced_session(service):
+            with traced_session(service, records=False):
                 pass
 
             self.assert_measures_nothing(service)
@@ -43,7 +43,7 @@ class NoTracerTest(unittest.TestCase):
             service.stop()
             service.use_only(lttng_sessiond="exit 3")
             service.start()
-            with traced_session(service):
+            with traced_session(service, records=False):
                 pass
 
             self.assert_measures_nothing(service)
@@ -54,7 +54,7 @@ class NoTracerTest(unittest.TestCase):
             service.stop()
             service.use_only()
             service.start()
-            client = start_session(service, trace_type=None)
+            client = start_session(service, trace_type=None, records=False)
             wait_for("the failed start", lambda: "kqTraceDidStart " in service.log())
             self.assertIn("started performance trace.", service.log())
             self.assertNotIn("Performance Trace Started", service.log())
@@ -71,6 +71,29 @@ class NoTracerTest(unittest.TestCase):
             self.assertEqual(service.scratch(), [])
 
 
+class TypeChangedTest(unittest.TestCase):
+    """The type of trace changes between a start and its stop, which chooses by the new one."""
+
+    def test_runner_that_has_finished_is_not_stopped_again(self):
+        with TracedService() as service:
+            service.stop()
+            service.use_only()
+            service.start()
+            client = start_session(service, records=False)
+            client.stop(REPORTER)
+            client.configure({"HVReportingTraceType": "artrace"}, REPORTER)
+            client.start_later(REPORTER)
+            client.valid(REPORTER)
+            client.configure({"HVReportingTraceType": "ktrace"}, REPORTER)
+
+            self.assertTrue(client.stop(REPORTER))
+
+            self.assertIsNone(service.process.poll())
+            self.assertEqual(service.log().count("Tearing down trace"), 1)
+            self.assertEqual(service.log().count("In write perf data"), 1)
+            client.close()
+
+
 class ResultsTest(unittest.TestCase):
     def test_directory_that_cannot_be_made_ends_the_service_with_status_1(self):
         with TracedService() as service:
@@ -78,7 +101,7 @@ class ResultsTest(unittest.TestCase):
             root = service.directory / "state/root"
             root.mkdir(parents=True, exist_ok=True)
             (root / "private").write_text("in the way")
-            client = start_session(service)
+            client = start_session(service, records=False)
             client.call_later("stopReportingSessionForID", "x", REPORTER)
 
             status = service.process.wait(DEADLINE)
@@ -91,7 +114,7 @@ class ResultsTest(unittest.TestCase):
     def test_trace_of_signposts_writes_a_file_without_values(self):
         with TracedService() as service:
             service.write_params([], trace_type="OSSignpost")
-            with traced_session(service):
+            with traced_session(service, records=False):
                 pass
 
             self.assertEqual(wait_for_results(service)["values"], {})

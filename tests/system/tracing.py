@@ -127,12 +127,18 @@ class TracedService(Service):
         """What the tracer's daemon lists; empty when none runs."""
         return self.lttng("list").stdout
 
+    def recordings(self):
+        """The traces that record now."""
+        return list(self.directory.glob("state/traces/recording/*"))
+
     def scratch(self):
         return list(self.directory.glob("state/traces/scratch/*"))
 
 
-def start_session(service, trace_type="ktrace"):
-    """A session of the type test that runs; gives its client."""
+def start_session(service, trace_type="ktrace", records=True):
+    """A session of the type test that runs; gives its client when what is emitted is recorded.
+
+    Of a session that is not to record anything, when its start has been carried out."""
     client = service.client()
     configuration = {"HVReportingMeridelPlistFilePath": str(service.params)}
     if trace_type is not None:
@@ -140,16 +146,24 @@ def start_session(service, trace_type="ktrace"):
     client.create(REPORTER)
     client.set_type(TEST, REPORTER)
     client.configure(configuration, REPORTER)
-    client.start_later(REPORTER)
-    client.valid(REPORTER)  # is answered when the start has been carried out
+    restart_session(service, client, records)
     return client
 
 
+def restart_session(service, client, records=True):
+    """The same for a session that is there already."""
+    before = service.recordings()
+    client.start_later(REPORTER)
+    client.valid(REPORTER)  # is answered when the start has been carried out
+    if records:
+        wait_for("the recording to begin", lambda: set(service.recordings()) - set(before))
+
+
 @contextlib.contextmanager
-def traced_session(service, trace_type="ktrace"):
+def traced_session(service, trace_type="ktrace", records=True):
     """The same, stopped at the end."""
-    client = start_session(service, trace_type)
-    yield
+    client = start_session(service, trace_type, records)
+    yield client
     client.stop(REPORTER)
     client.valid(REPORTER)
     client.close()

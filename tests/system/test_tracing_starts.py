@@ -1,0 +1,143 @@
+"""A traced session that starts holds nobody up, whatever the tracer's daemon does."""
+
+import contextlib
+import select
+import socket
+import time
+import unittest
+
+from harness import DEADLINE, wait_for
+from tracing import REPORTER, TEST, TracedService, require_tracer
+
+BOUND = 0.050  # seconds
+TRIES = 5  # of which a busy machine may spoil all but one
+REQUESTS = 100  # at least, while the session starts
+STARTS_WITHIN = 5.0  # seconds; to look no further when nothing tells of the start
+
+
+def setUpModule():
+    require_tracer()
+
+
+@contextlib.contextmanager
+def silent_daemon(service):
+    """Where the service looks for its daemon: accepts, and never answers. Gives a function that
+    returns when the service has asked."""
+    directory = service.home / ".lttng"
+    directory.mkdir()
+    with contextlib.ExitStack() as stack:
+        listener = stack.enter_context(socket.socket(socket.AF_UNIX, socket.SOCK_STREAM))
+        listener.bind(str(directory / "client-lttng-sessiond"))
+        listener.listen(16)
+
+        def asked():
+            """True once a connection stays open with a question in it."""
+            while select.select([listener], [], [], 0)[0]:
+                connection = stack.enter_context(listener.accept()[0])
+                connection.settimeout(DEADLINE)
+                if connection.recv(1):
+                    return True
+            return False
+
+        yield asked
+
+
+class StartTest(unittest.TestCase):
+    def worst_answer_while_starting(self, service, trace_type, has_started):
+        """How long another client waited for an answer at most, in seconds, until has_started()."""
+        client = service.client()
+        other = service.client()
+        client.create(REPORTER)
+        client.set_type(TEST, REPORTER)
+        client.configure({"HVReportingMeridelPlistFilePath": str(service.params),
+                          "HVReportingTraceType": trace_type}, REPORTER)
+        worst = 0.0
+        requests = 0
+        client.start_later(REPORTER)
+        end = time.monotonic() + STARTS_WITHIN
+        while requests < REQUESTS or (not has_started() and time.monotonic() < end):
+            begin = time.monotonic()
+            other.reporters()
+            worst = max(worst, time.monotonic() - begin)
+            requests += 1
+        client.close()
+        other.close()
+        return worst
+
+    def assert_others_are_answered(self, trace_type, measure):
+        """measure(service) measures one start; the least of some tries must keep to the bound."""
+        worst = []
+        while len(worst) < TRIES and min(worst, default=1) > BOUND:
+            with TracedService() as service:
+                worst.append(measure(service))
+        print(f"{trace_type}: others waited at most {min(worst) * 1000:.1f} ms", flush=True)
+        self.assertLess(min(worst), BOUND, f"{trace_type}: {worst}")
+
+    def test_healthy_daemon(self):
+        for trace_type in ("ktrace", "artrace"):
+            with self.subTest(trace_type):
+                self.assert_others_are_answered(
+                    trace_type, lambda service: self.worst_answer_while_starting(
+                        service, trace_type, service.recordings))
+
+    def test_missing_daemon(self):
+        failures = {"ktrace": "Could not start ktrace session", "artrace": "kqTraceDidStart "}
+        for trace_type, failure in failures.items():
+            def measure(service):
+                service.stop()
+                service.use_only()
+                service.start()
+                return self.worst_answer_while_starting(
+                    service, trace_type, lambda: failure in service.log())
+
+            with self.subTest(trace_type):
+                self.assert_others_are_answered(trace_type, measure)
+
+    def test_daemon_that_accepts_and_never_answers(self):
+        for trace_type in ("ktrace", "artrace"):
+            def measure(service):
+                with silent_daemon(service) as asked:
+                    return self.worst_answer_while_starting(service, trace_type, asked)
+
+            with self.subTest(trace_type):
+                self.assert_others_are_answered(trace_type, measure)
+
+    def test_daemon_that_never_accepts(self):
+        for trace_type in ("ktrace", "artrace"):
+            def measure(service):
+                service.stop()
+                service.use_only(lttng_sessiond="exec /bin/sleep 1000")
+                service.start()
+                return self.worst_answer_while_starting(service, trace_type, service.daemon)
+
+            with self.subTest(trace_type):
+                self.assert_others_are_answered(trace_type, measure)
+
+
+class OrderTest(unittest.TestCase):
+    def test_stop_is_carried_out_after_a_start_that_takes_its_time(self):
+        with TracedService() as service:
+            with silent_daemon(service) as asked:
+                client = service.client()
+                client.create(REPORTER)
+                client.set_type(TEST, REPORTER)
+                client.configure({"HVReportingMeridelPlistFilePath": str(service.params),
+                                  "HVReportingTraceType": "ktrace"}, REPORTER)
+                client.start_later(REPORTER)
+                wait_for("the service's question", asked)
+                stop = client.call_later("stopReportingSessionForID", "x", REPORTER)
+                wait_for("the stop", lambda: f"ending session {REPORTER}" in service.log())
+                self.assertNotIn("Tearing down trace", service.log())
+            # The daemon has gone, and the start fails.
+            stop.wait()
+            client.close()
+
+            log = service.log()
+            self.assertLess(log.index("Starting tracing: T"),
+                            log.index("Could not start ktrace session"))
+            self.assertLess(log.index("Could not start ktrace session"),
+                            log.index("Tearing down trace :  T"))
+
+
+if __name__ == "__main__":
+    unittest.main()
