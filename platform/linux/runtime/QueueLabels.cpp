@@ -7,11 +7,10 @@ QueueLabel& QueueLabels::label(std::string_view text) {
   const MutexLock lock(mutex_);
   if (const auto known = labels_.find(text); known != labels_.end()) return known->second;
   const std::string name(text);
-  const auto place =
-      labels_
-          .try_emplace(name, std::string_view(), statistics_.counter(kPiece, name + ": jobs added"),
-                       statistics_.counter(kPiece, name + ": jobs run"))
-          .first;
+  const auto place = labels_
+                         .try_emplace(name, statistics_.counter(kPiece, name + ": jobs added"),
+                                      statistics_.counter(kPiece, name + ": jobs run"))
+                         .first;
   place->second.text = place->first;
   return place->second;
 }

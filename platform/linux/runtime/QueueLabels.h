@@ -14,7 +14,9 @@ namespace halvox::platform::linux_ {
 // What the shared queues of one label have in common, for whoever looks for a queue that is stuck:
 // how many jobs were added to them and were run, and how many of them are at work right now.
 struct QueueLabel {
-  std::string_view text;  // owned by the labels
+  QueueLabel(Counter& addedJobs, Counter& ranJobs) : added(addedJobs), run(ranJobs) {}
+
+  std::string_view text{};  // owned by the labels
   Counter& added;
   Counter& run;
   std::atomic<int> atWork{0};  // orders with nothing: it is only looked at
