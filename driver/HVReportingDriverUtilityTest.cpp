@@ -96,6 +96,18 @@ TEST_F(HVReportingDriverUtilityTest, SnapshotSamplesEachSubscriptionUnderItsDesc
                    "sampling driver Haptics-Stats", "samples Haptics-Stats"}));
 }
 
+TEST_F(HVReportingDriverUtilityTest, SamplingIsLoggedAtInfoLevel) {
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
+  const auto utility = makeUtility();
+
+  utility.getSnapShot();
+  utility.sendDriverLogsForSession(session_);
+
+  EXPECT_EQ(lines(LogLevel::kInfo),
+            (Texts{"sampling driver Speaker-(null)", "getting latest samples",
+                   "done getting latest samples"}));
+}
+
 TEST_F(HVReportingDriverUtilityTest, WithoutASnapshotSamplesAreTakenButNothingIsSent) {
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
   const auto utility = makeUtility();

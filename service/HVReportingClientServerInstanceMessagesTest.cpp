@@ -375,6 +375,13 @@ TEST_F(HVReportingClientServerInstanceMessagesTest, TheSendersProcessIsLookedUpB
   EXPECT_EQ(platform_.process.lookUps(), before + 1);
 }
 
+TEST_F(HVReportingClientServerInstanceMessagesTest, AStandaloneMessageCountsAsDelivered) {
+  sendToAll(client_);
+
+  EXPECT_THAT(platform_.statistics.values("messages"),
+              UnorderedElementsAre(Pair("received", 1U), Pair("delivered", 1U)));
+}
+
 TEST_F(HVReportingClientServerInstanceMessagesTest, AHistoryIsChargedToTheClientWhoseSessionItIs) {
   createAndStart(client_, 7);
   const auto before = clientOf(client_)->resourceUse().bytes;

@@ -4,27 +4,33 @@ namespace halvox {
 namespace {
 
 using platform::Dictionary;
+using platform::JournalKind;
 using testing::ElementsAre;
 
 // Keeps the sessions whose messages it is handed for the bug capture. The session of a message that
 // belongs to none is seen here and nowhere else.
 class KeepingDelegate final : public TestDelegate {
  public:
-  void handleEventForVEK(const platform::Message& /*message*/, AudioEventCategory /*category*/,
+  void handleEventForVEK(const platform::Message& message, AudioEventCategory /*category*/,
                          AudioEventType /*type*/,
                          const std::shared_ptr<HVReportingSession>& session,
                          std::string_view /*processName*/) override {
+    if (journal != nullptr) journal->note("bug capture");
+    messages.push_back(message);
     sessions.push_back(session);
   }
 
+  platform::Journal* journal = nullptr;  // the test's
+  std::vector<platform::Message> messages;
   Sessions sessions;
 };
 
 class HVReportingStandaloneSessionTest : public DelegateTest<KeepingDelegate> {
  protected:
-  void sendToNobody() {
-    client_->sendMessage(Dictionary{{"a", 1}}, AudioEventCategory::kPlayback,
-                         AudioEventType::kStart, std::nullopt, [](const auto& /*error*/) {});
+  void sendToNobody(const platform::Message& message = Dictionary{{"a", 1}},
+                    AudioEventType type = AudioEventType::kStart) {
+    client_->sendMessage(message, AudioEventCategory::kPlayback, type, std::nullopt,
+                         [](const auto& /*error*/) {});
     run();
   }
 };
@@ -40,6 +46,35 @@ TEST_F(HVReportingStandaloneSessionTest, IsOwnedByTheServiceAndOfAnUnknownApplic
   EXPECT_EQ(session.configuration(), (Dictionary{{"HostApplicationDisplayID", "Unknown"}}));
   EXPECT_FALSE(session.started());
   EXPECT_FALSE(session.tlmReportingEnabled());
+}
+
+TEST_F(HVReportingStandaloneSessionTest, BackEndsComeInTheirOrderTheBugCaptureLast) {
+  delegate_->journal = &platform_.journal;
+  const auto steps = [this](const Dictionary& message, AudioEventType type) {
+    platform_.journal.clear();
+    sendToNobody(message, type);
+    std::vector<std::string> texts;
+    for (const auto& entry :
+         platform_.journal.entries({JournalKind::kAnalyticsEvent, JournalKind::kPowerEvent,
+                                    JournalKind::kMetric, JournalKind::kNote})) {
+      texts.push_back(entry.text);
+    }
+    return texts;
+  };
+
+  EXPECT_THAT(
+      steps({{"EngineOnTime", 1}}, AudioEventType::kJoulebook),
+      ElementsAre("com.tarno.halvox.Playback.Joulebook", "com.tarno.standalone.Playback.Joulebook",
+                  "Oxbow_Haptics", "bug capture"));
+  EXPECT_THAT(steps({{"node", "mixer"}}, AudioEventType::kIssueDetector),
+              ElementsAre("com.tarno.halvox.Playback.IssueDetector",
+                          "com.tarno.standalone.Playback.IssueDetector", "5963779", "bug capture"));
+}
+
+TEST_F(HVReportingStandaloneSessionTest, NoMessageAtAllGetsNoStamps) {
+  sendToNobody(std::nullopt);
+
+  EXPECT_THAT(delegate_->messages, ElementsAre(std::nullopt));
 }
 
 TEST_F(HVReportingStandaloneSessionTest, IsMadeAnewForEachMessage) {

@@ -134,6 +134,31 @@ TEST_F(HVReportingSessionLinkMessagesTest, ASessionThatBecameATestSendsNoMore) {
   EXPECT_THAT(framework_.messages(), IsEmpty());
 }
 
+// The counts say why a message was not sent: of several reasons the first of this order.
+TEST_F(HVReportingSessionLinkMessagesTest, ARepeatCountsAsOneThoughTheLinkIsDown) {
+  start();  // no server is found
+
+  send({{"a", 1}});
+  send({{"a", 1}});
+  run();
+
+  EXPECT_THAT(platform_.statistics.values("link"),
+              UnorderedElementsAre(Pair("received", 2U), Pair("suppressed: redundant", 1U),
+                                   Pair("dropped: no back-end", 1U)));
+}
+
+TEST_F(HVReportingSessionLinkMessagesTest, ARepeatOfATestSessionCountsAsOneOfATestSession) {
+  open();
+  session_->setServiceType(AudioServiceType::kTest);
+
+  send({{"a", 1}});
+  send({{"a", 1}});
+  run();
+
+  EXPECT_THAT(platform_.statistics.values("link"),
+              UnorderedElementsAre(Pair("received", 2U), Pair("dropped: test session", 2U)));
+}
+
 TEST_F(HVReportingSessionLinkMessagesTest, TheReplyComesAtOnceThoughTheLinkFailsLater) {
   open();
   framework_.setOutcome({.sent = false, .error = platform::Error{.description = "no route"}});

@@ -148,6 +148,20 @@ TEST_F(HVReportingSessionTracingTest, RunnerRecordsFromStartToStop) {
   EXPECT_EQ(platform_.resultsFiles.files().size(), 1U);
 }
 
+TEST_F(HVReportingSessionTracingTest, LinkIsAskedForBeforeTheTraceIsSetUp) {
+  chooseRunner();
+  session_->setTlmReportingEnabled(true);
+
+  session_->start();
+
+  std::vector<std::string> labels;
+  for (const auto& queue : platform_.dispatch.createdQueues()) labels.push_back(queue.label);
+  ASSERT_GE(labels.size(), 2U);
+  EXPECT_EQ(labels[0], "com.tarno.halvox.session.tlmreporting");
+  EXPECT_EQ(labels[1], "Tracing Queue");
+  session_->stop();
+}
+
 TEST_F(HVReportingSessionTracingTest, SettingUpTheRunnerIsLoggedByTheSession) {
   chooseRunner();
 

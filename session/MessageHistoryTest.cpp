@@ -121,6 +121,25 @@ TEST_F(MessageHistoryTest, AMessageOfTenFieldsCostsAtMostFiveHundredBytes) {
   EXPECT_GE(history_.memorySize() - before, 14 * sizeof(Dictionary::Entry));
 }
 
+// A client can name many categories that share the text of none.
+TEST_F(MessageHistoryTest, EachCodeAndEachBaseIsPaidForWithAboutANodeOfATable) {
+  constexpr std::uint32_t kCodes = 100;
+  constexpr std::size_t kNode = 48;
+  const std::string text = "Undefined_Start";
+  const auto category = [](std::uint32_t code) { return static_cast<AudioEventCategory>(code); };
+  history_.base(category(16), kStart);
+  const std::size_t first = history_.memorySize();
+  EXPECT_GE(first, sizeof(MessageHistory::Base) + 2 * text.size() + 2 * kNode);
+
+  for (std::uint32_t code = 1; code <= kCodes; ++code) history_.base(category(16 + code), kStart);
+  const std::size_t ofCodes = history_.memorySize() - first;
+  EXPECT_GE(ofCodes, kCodes * (kNode + 2 * sizeof(void*)));
+  EXPECT_LE(ofCodes, kCodes * 2 * kNode);
+
+  history_.base(category(17), kStart);  // known
+  EXPECT_EQ(history_.memorySize() - first, ofCodes);
+}
+
 class EqualApartFromVolatileKeysTest : public testing::Test {
  protected:
   platform::FakePlatform platform_;

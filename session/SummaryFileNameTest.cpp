@@ -78,6 +78,27 @@ TEST(SummaryFileNameTest, ALongNameIsCutToWhatAFileNameHolds) {
   appPart(std::string(5000, 'x'));
 }
 
+TEST(SummaryFileNameTest, ANameThatJustFitsIsNotCut) {
+  const std::size_t room = 255 - nameOf("").size();
+
+  EXPECT_EQ(appPart(std::string(room, 'x')), std::string(room, 'x'));
+  EXPECT_EQ(appPart(std::string(room - 1, 'x')), std::string(room - 1, 'x'));
+  EXPECT_EQ(appPart(std::string(room + 1, 'x')), std::string(room, 'x'));
+}
+
+TEST(SummaryFileNameTest, ALongNameWithoutTheBeginningOfACharacterIsCutToNothing) {
+  EXPECT_EQ(appPart(std::string(5000, '\x80')), "");
+}
+
+TEST(SummaryFileNameTest, NoCharacterIsCutApartWhereverTheCutFalls) {
+  std::string characters;
+  for (int count = 0; count < 2000; ++count) characters += "日";
+
+  for (const std::string beginning : {"", "x", "xx"}) {
+    EXPECT_EQ(appPart(beginning + characters).size() % 3, beginning.size());
+  }
+}
+
 TEST(SummaryFileNameTest, NoCharacterIsCutApart) {
   std::string longName = "x";
   for (int count = 0; count < 2000; ++count) longName += "日";

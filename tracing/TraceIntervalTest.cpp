@@ -72,6 +72,11 @@ TEST_F(TraceIntervalTest, SameThreadMeasuresEachThreadByItself) {
   EXPECT_TRUE(platform_.log.lines().empty());
 }
 
+TEST_F(TraceIntervalTest, SameThreadUsesAStartOnce) {
+  EXPECT_EQ(sameThread({event(kBegin, 10), event(kEnd, 20), event(kEnd, 30)}), Values{10});
+  EXPECT_EQ(platform_.log.texts(LogLevel::kDebug), Texts{stops(0)});
+}
+
 TEST_F(TraceIntervalTest, SameThreadTakesAStartAtTickZero) {
   EXPECT_EQ(sameThread({event(kBegin, 0), event(kEnd, 5)}), Values{5});
 }
