@@ -47,6 +47,13 @@ TEST_F(HVReportingJoulebookUtilityTest, AnEngineReportIsLoggedWithItsApplication
   EXPECT_THAT(platform_.log.lines(), IsEmpty());
 }
 
+TEST_F(HVReportingJoulebookUtilityTest, AnEngineReportIsShownInItsOrder) {
+  handle(Dictionary{{"hvreporting_timestamp", 1000.25}, {"EngineOnTime", 4.5}});
+
+  EXPECT_EQ(platform::describe(platform_.powerLog.events().front().payload),
+            "{EngineOnDuration = 4.5; ApplicationName = A; TimestampEnd = 1000.25}");
+}
+
 TEST_F(HVReportingJoulebookUtilityTest, AnEngineReportWithoutATimeIsLoggedAsAnErrorAndWithoutIt) {
   handle(Dictionary{{"EngineOnTime", 4.5}});
 

@@ -135,6 +135,14 @@ TEST_F(HVReportingZUBBridgeTest, DurationsInTextsAreTheIntegerThatTheyBeginWith)
   }
 }
 
+TEST_F(HVReportingZUBBridgeTest, OnlyBlanksMayStandBeforeTheIntegerOfAText) {
+  for (int code = 0x21; code < 0x7F; ++code) {
+    const char letter = static_cast<char>(code);
+    if (letter == '+' || letter == '-' || (letter >= '0' && letter <= '9')) continue;
+    EXPECT_EQ(durationOf(std::string(1, letter) + "5"), 0) << letter;
+  }
+}
+
 TEST_F(HVReportingZUBBridgeTest, ADurationThatIsNeitherNumberNorTextIsZero) {
   EXPECT_EQ(durationOf(platform::Array{12}), 0);
 }

@@ -40,6 +40,24 @@ TEST_F(HVReportingServiceDelegateStateTest, TellsTheClientsAndTheirSessions) {
   EXPECT_EQ(clients[1].dictionary().find("session_count")->toInt64(), 0);
 }
 
+TEST_F(HVReportingServiceDelegateStateTest, IsTheWholeOfTheseEntries) {
+  platform_.clock.setCurrentDate({1000});
+  const Connection player = connect(12, "player");
+  createAndStart(player, 7);
+  const Dictionary client{{"pid", 12},
+                          {"process_name", "player"},
+                          {"start_date", platform::Date{1000}},
+                          {"session_count", 1},
+                          {"sessions", platform::Array{sessionOf(player, 7)->description()}}};
+
+  EXPECT_EQ(state().value_or(Dictionary{}), (Dictionary{{"reporting_enabled", true},
+                                                        {"active_session_count", 1},
+                                                        {"client_count", 1},
+                                                        {"session_count", 1},
+                                                        {"sessions_described", 1},
+                                                        {"clients", platform::Array{client}}}));
+}
+
 TEST_F(HVReportingServiceDelegateStateTest, DescribesABoundedNumberOfSessionsAndCountsAll) {
   const Connection player = connect(12);
   for (std::int64_t id = 1; id <= 5003; ++id) create(player, id);
