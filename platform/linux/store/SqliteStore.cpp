@@ -135,7 +135,8 @@ bool SqliteStore::logHasRoom() {
 }
 
 std::optional<StoreError> SqliteStore::openDatabase() {
-  // An orderly close removes the log. A log that exists was left by a run that was killed.
+  // An orderly close removes the log. One that exists was left by a run that was killed, or that
+  // ended before it had checked the database.
   const bool wasLeftOpen = files_.logBytes() > 0;
   if (auto error = openStoreDatabase(files_, sizes_, database_)) return error;
   if (auto error = useDatabase()) return error;
@@ -258,16 +259,20 @@ bool SqliteStore::maintainOnce() {
 }
 
 void SqliteStore::closeDatabase() {
-  check_.stop();
+  const bool isChecked = check_.stop();
   releaseStatements();
   if (!database_.isOpen()) return;
   // sqlite3_close() also copies the log, but only when no other connection is open.
   sqlite3_wal_checkpoint_v2(database_.get(), nullptr, SQLITE_CHECKPOINT_PASSIVE, nullptr, nullptr);
+  // By the log that stays the next run sees that it has to check.
+  if (!isChecked) return abandon(database_);
   database_.close();
 }
 
 void SqliteStore::abandonDatabase() {
-  check_.stop();  // the caller may rename the file that the check reads
+  // The caller may rename the file that the check reads. The log stays, and with it a check that
+  // is not finished.
+  static_cast<void>(check_.stop());
   releaseStatements();
   abandon(database_);
 }

@@ -3,6 +3,7 @@
 #include <algorithm>
 #include <chrono>
 #include <limits>
+#include <system_error>
 #include <utility>
 
 #include <linux/ioprio.h>
@@ -26,6 +27,8 @@ using Clock = std::chrono::steady_clock;
 constexpr std::chrono::milliseconds kSlice{20};
 constexpr std::chrono::milliseconds kShortestPause{1};
 constexpr std::chrono::milliseconds kBusyTimeout{250};
+
+constexpr const char* kNotCheckedNow = "; it is not checked before the next start";
 
 // Lowers the priority of this thread for the processor and for the disk. The scheduler's idle class
 // would be too low: on a busy machine a slice would not end for minutes, and the log would grow
@@ -56,13 +59,18 @@ SqliteCode readSlice(Statement& rows, std::int64_t& last, std::uint64_t& count) 
 }  // namespace
 
 void StoreCheck::begin(const std::string& file, const StoreExtent& extent, OnDamage onDamage) {
-  stop();
+  static_cast<void>(stop());
   records_ = 0;
-  thread_ = std::thread(
-      [this, file, extent, onDamage = std::move(onDamage)] { run(file, extent, onDamage); });
+  isChecked_ = false;
+  try {
+    thread_ = std::thread(
+        [this, file, extent, onDamage = std::move(onDamage)] { run(file, extent, onDamage); });
+  } catch (const std::system_error& error) {
+    kLog.error("cannot check ", file, ": ", error.what(), kNotCheckedNow);
+  }
 }
 
-void StoreCheck::stop() {
+bool StoreCheck::stop() {
   {
     const MutexLock lock(mutex_);
     isStopping_ = true;
@@ -72,6 +80,7 @@ void StoreCheck::stop() {
   const MutexLock lock(mutex_);
   isStopping_ = false;
   finding_.reset();
+  return std::exchange(isChecked_, true);
 }
 
 std::optional<std::string> StoreCheck::finding() {
@@ -82,7 +91,8 @@ std::optional<std::string> StoreCheck::finding() {
 void StoreCheck::run(const std::string& file, const StoreExtent& extent, const OnDamage& onDamage) {
   ::pthread_setname_np(::pthread_self(), "halvox-check");
   giveWayToOthers();
-  kLog.info("checking ", file, " in the background because the last run did not close it");
+  kLog.info("checking ", file,
+            " in the background because the last run did not close it, or not check it to the end");
   Database database;
   std::string what;
   Outcome outcome = Outcome::kUnreadable;
@@ -94,12 +104,13 @@ void StoreCheck::run(const std::string& file, const StoreExtent& extent, const O
   }
   switch (outcome) {
     case Outcome::kGoOn:
+      isChecked_ = true;
       kLog.info("checked ", file, ": read ", records_, " records and found no damage");
       return;
     case Outcome::kStopped:
       return;
     case Outcome::kUnreadable:
-      kLog.error("cannot check ", file, ": ", what, "; it is not checked before the next start");
+      kLog.error("cannot check ", file, ": ", what, kNotCheckedNow);
       return;
     case Outcome::kDamaged:
       break;

@@ -25,7 +25,8 @@ namespace halvox::platform::linux_ {
 //
 // Reads only the records that existed when the database was opened: this run has written the later
 // ones. Reports only damage. When the file cannot be read for another reason, logs an error and
-// gives up: the store notices such an error itself when it needs the page.
+// gives up: the store notices such an error itself when it needs the page. A check that did not
+// come to its end is for the store to begin again when it opens the database the next time.
 //
 // Owned by the store. Only the store's own threads call begin() and stop(), one at a time.
 class StoreCheck {
@@ -37,12 +38,14 @@ class StoreCheck {
   StoreCheck() = default;
   StoreCheck(const StoreCheck&) = delete;
   StoreCheck& operator=(const StoreCheck&) = delete;
-  ~StoreCheck() { stop(); }
+  ~StoreCheck() { static_cast<void>(stop()); }
 
-  // Stops a running check and starts to check `file`.
+  // Stops a running check and starts to check `file`. Without a thread to have, logs an error and
+  // gives up.
   void begin(const std::string& file, const StoreExtent& extent, OnDamage onDamage);
-  // Ends the thread and forgets its finding. Blocks for at most one slice. Idempotent.
-  void stop();
+  // Ends the thread and forgets its finding. Blocks for at most one slice. Returns false when the
+  // file that it was to check still needs a check; idempotent but for that.
+  bool stop();
   // Any thread. Describes the damage; std::nullopt while none was found.
   [[nodiscard]] std::optional<std::string> finding() HALVOX_EXCLUDES(mutex_);
 
@@ -57,7 +60,9 @@ class StoreCheck {
   [[nodiscard]] bool pause(std::chrono::steady_clock::duration length) HALVOX_EXCLUDES(mutex_);
 
   std::thread thread_;
-  std::uint64_t records_ = 0;  // read so far; used by the thread only
+  // Used by the thread, and by others when it has ended.
+  std::uint64_t records_ = 0;  // read so far
+  bool isChecked_ = true;      // nothing is left to check
   Mutex mutex_;
   Condition stopping_;
   bool isStopping_ HALVOX_GUARDED_BY(mutex_) = false;

@@ -5,6 +5,7 @@
 #include <string>
 
 #include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/testing/NoThreadsToHave.h"
 
 // What the store does with a database that the last run did not close.
 
@@ -158,6 +159,39 @@ TEST_F(StoreCheckTest, ReadsNothingAfterAnOrderlyEnd) {
   stop();
   EXPECT_THAT(setAsideFiles(), IsEmpty());
   EXPECT_THAT(platform.log.texts(LogLevel::kInfo), Not(Contains(HasSubstr("in the background"))));
+}
+
+TEST_F(StoreCheckTest, ChecksAgainAfterARunThatEndedBeforeItsCheck) {
+  leaveKilledStore();
+  damage();
+  start();
+  stop();
+  start();
+  EXPECT_TRUE(eventuallySetAside());
+}
+
+TEST_F(StoreCheckTest, LeavesTheCheckToTheNextRunWhenThereIsNoThread) {
+  StoreCheck check;
+  {
+    const NoThreadsToHave noThreads;
+    check.begin(database(), {}, [] {});
+  }
+  EXPECT_FALSE(check.stop());
+  EXPECT_TRUE(check.stop());
+  EXPECT_THAT(platform.log.texts(LogLevel::kError), ElementsAre(HasSubstr("cannot check")));
+}
+
+TEST_F(StoreCheckTest, ReadsNothingAfterARunThatFinishedItsCheck) {
+  leaveKilledStore();
+  start();
+  ASSERT_TRUE(eventuallyLogged(LogLevel::kInfo, "found no damage"));
+  stop();
+  damage();
+  start();
+  stop();
+  EXPECT_THAT(setAsideFiles(), IsEmpty());
+  EXPECT_THAT(platform.log.texts(LogLevel::kInfo),
+              Contains(HasSubstr("in the background")).Times(1));
 }
 
 TEST_F(StoreCheckTest, FindsADamagedTableOfNames) {
