@@ -137,20 +137,30 @@ bool SqliteStore::logHasRoom() {
 std::optional<StoreError> SqliteStore::openDatabase() {
   // An orderly close removes the log. One that exists was left by a run that was killed, or that
   // ended before it had checked the database.
-  const bool wasLeftOpen = files_.logBytes() > 0;
+  bool mustCheck = files_.logBytes() > 0;
   if (auto error = openStoreDatabase(files_, sizes_, database_)) return error;
-  if (auto error = useDatabase()) return error;
-  if (wasLeftOpen) {
+  SqliteCode code = useDatabase();
+  if (meansDamage(code)) {
+    mustCheck = false;
+    std::string newName;
+    if (auto error = beginAnew(database_.errorText(), newName)) return error;
+    code = useDatabase();
+  }
+  if (code != SQLITE_OK) return cannotRead();
+  if (mustCheck) {
     check_.begin(files_.database(), extent_, [this] { queue_.requestRound(); });
   }
   return std::nullopt;
 }
 
-std::optional<StoreError> SqliteStore::useDatabase() {
+SqliteCode SqliteStore::useDatabase() {
   identity_ = files_.identity();
-  SqliteCode code = StoreExtent::read(database_, extent_);
-  if (code == SQLITE_OK) code = prepareStatements();
-  if (code == SQLITE_OK) return std::nullopt;
+  const SqliteCode code = StoreExtent::read(database_, extent_);
+  return code == SQLITE_OK ? prepareStatements() : code;
+}
+
+// Why useDatabase() failed. Closes the database.
+StoreError SqliteStore::cannotRead() {
   StoreError error{
       StoreError::Kind::kCannotOpen,
       files_.database().native() + ": cannot read the database: " + database_.errorText()};
@@ -158,18 +168,21 @@ std::optional<StoreError> SqliteStore::useDatabase() {
   return error;
 }
 
-// Renames the damaged database and starts a new one. Copies the records of this run, which are
-// newer than `extent_`, into the new one. Those of earlier runs are only in the renamed file.
-void SqliteStore::replaceDamaged(const std::string& finding) {
-  const StoreExtent extent = extent_;
+// Renames the damaged database and opens a new one.
+std::optional<StoreError> SqliteStore::beginAnew(const std::string& finding, std::string& newName) {
   abandonDatabase();
-  std::string newName;
-  if (const auto error = files_.setAside(newName)) return kLog.error("", error->description);
+  if (auto error = files_.setAside(newName)) return error;
   kLog.error("the database is damaged: ", finding, "; it was set aside as ", newName,
              ", and a new database takes its place");
-  if (const auto error = openStoreDatabase(files_, sizes_, database_)) {
-    return kLog.error("", error->description);
-  }
+  return openStoreDatabase(files_, sizes_, database_);
+}
+
+// Begins a new database. Copies the records of this run, which are newer than `extent_`, into it.
+// Those of earlier runs are only in the renamed file.
+void SqliteStore::replaceDamaged(const std::string& finding) {
+  const StoreExtent extent = extent_;
+  std::string newName;
+  if (const auto error = beginAnew(finding, newName)) return kLog.error("", error->description);
   std::string problem;
   const std::uint64_t kept = copyRecordsAfter(extent, newName, database_, problem);
   kLog.notice("copied the ", kept, " records that were stored since the start to the new database");
@@ -177,7 +190,7 @@ void SqliteStore::replaceDamaged(const std::string& finding) {
     kLog.error("cannot copy all records that were stored since the start; the others are only in ",
                newName, ": ", problem);
   }
-  if (const auto error = useDatabase()) kLog.error("", error->description);
+  if (useDatabase() != SQLITE_OK) kLog.error("", cannotRead().description);
 }
 
 SqliteCode SqliteStore::prepareStatements() {

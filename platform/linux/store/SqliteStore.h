@@ -91,7 +91,10 @@ class SqliteStore {
   [[nodiscard]] bool logHasRoom();
   [[nodiscard]] SqliteCode writeTransaction();
   [[nodiscard]] std::optional<StoreError> openDatabase();
-  [[nodiscard]] std::optional<StoreError> useDatabase();
+  [[nodiscard]] SqliteCode useDatabase();
+  [[nodiscard]] StoreError cannotRead();
+  [[nodiscard]] std::optional<StoreError> beginAnew(const std::string& finding,
+                                                    std::string& newName);
   [[nodiscard]] SqliteCode prepareStatements();
   void replaceDamaged(const std::string& finding);
   void releaseStatements();

@@ -194,6 +194,24 @@ TEST_F(StoreCheckTest, ReadsNothingAfterARunThatFinishedItsCheck) {
               Contains(HasSubstr("in the background")).Times(1));
 }
 
+TEST_F(StoreCheckTest, StartsWithANewDatabaseWhenTheNewestRecordsCannotBeRead) {
+  start();
+  send(1);
+  stop();
+  const auto root =
+      rows(database(), "SELECT rootpage FROM sqlite_schema WHERE name = 'analytics_records'");
+  ASSERT_THAT(root, SizeIs(1));
+  std::string content = readFile(database());
+  const std::size_t page = 8192;
+  content.replace((std::stoul(root.front()) - 1) * page, page, std::string(page, '\xA5'));
+  writeFile(database(), content);
+  start();
+  send(2);
+  stop();
+  EXPECT_THAT(setAsideFiles(), Not(IsEmpty()));
+  EXPECT_THAT(payloads(), ElementsAre(numbered(2)));
+}
+
 TEST_F(StoreCheckTest, FindsADamagedTableOfNames) {
   leaveKilledStore();
   // The pages of the table and of its index are among the first.
