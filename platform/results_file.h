@@ -27,7 +27,9 @@ class ResultsFileService {
                                std::uint32_t version, std::uint32_t flags) = 0;
   virtual void sswriter_new_value(Sswriter& writer, std::string_view name, ssunit unit,
                                   double value) = 0;
-  // Finishes the file, which then has its name, and lets go of the writer.
+  // Finishes the file, which then has its name, in the place of one that had it, and lets go of the
+  // writer. Until then nobody sees it; a writer that is destroyed instead leaves nothing. No
+  // writer: nothing happens.
   virtual void sswriter_close(Writer writer) = 0;
 };
 

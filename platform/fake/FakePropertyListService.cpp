@@ -1,18 +1,23 @@
 #include "platform/fake/FakePropertyListService.h"
 
+#include <cstring>
 #include <span>
 #include <utility>
 
 namespace halvox::platform {
 
-void FakePropertyListService::setFile(std::string path, Value root) {
+void FakePropertyListService::set(std::string path, std::optional<Value> content) {
   const std::lock_guard lock(mutex_);
-  files_.insert_or_assign(std::move(path), std::move(root));
+  files_.insert_or_assign(std::move(path), contents_.size());
+  contents_.push_back(std::move(content));
+}
+
+void FakePropertyListService::setFile(std::string path, Value root) {
+  set(std::move(path), std::move(root));
 }
 
 void FakePropertyListService::setBrokenFile(std::string path) {
-  const std::lock_guard lock(mutex_);
-  files_.insert_or_assign(std::move(path), std::nullopt);
+  set(std::move(path), std::nullopt);
 }
 
 void FakePropertyListService::setCurrentDirectory(std::string path) {
@@ -25,15 +30,15 @@ std::string FakePropertyListService::currentDirectory() const {
   return currentDirectory_;
 }
 
-// The bytes of a fake file are its path.
 std::optional<Data> FakePropertyListService::readFile(std::string_view path,
                                                       std::optional<Error>& error) const {
   const std::lock_guard lock(mutex_);
-  if (!files_.contains(path)) {
+  const auto file = files_.find(path);
+  if (file == files_.end()) {
     error = Error{.description = "no file " + std::string(path)};
     return std::nullopt;
   }
-  return Data(std::as_bytes(std::span(path)));
+  return Data(std::as_bytes(std::span(&file->second, 1)));
 }
 
 std::optional<Value> FakePropertyListService::parse(const std::optional<Data>& bytes,
@@ -42,15 +47,15 @@ std::optional<Value> FakePropertyListService::parse(const std::optional<Data>& b
     error = Error{.description = "no bytes"};
     return std::nullopt;
   }
-  const auto path = bytes->bytes();
   const std::lock_guard lock(mutex_);
-  const auto file =
-      files_.find(std::string_view(reinterpret_cast<const char*>(path.data()), path.size()));
-  if (file == files_.end() || !file->second.has_value()) {
+  std::size_t number = contents_.size();
+  const auto read = bytes->bytes();
+  if (read.size() == sizeof number) std::memcpy(&number, read.data(), sizeof number);
+  if (number >= contents_.size() || !contents_[number].has_value()) {
     error = Error{.description = "no property list"};
     return std::nullopt;
   }
-  return file->second;
+  return contents_[number];
 }
 
 }  // namespace halvox::platform

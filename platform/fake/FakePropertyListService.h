@@ -2,13 +2,16 @@
 
 #include <map>
 #include <mutex>
+#include <optional>
 #include <string>
+#include <vector>
 
 #include "platform/property_list.h"
 
 namespace halvox::platform {
 
-// Property-list files that a test makes up. Any thread may call.
+// Property-list files that a test makes up. The bytes of a file are the number of its content, so
+// bytes that were read stay what they were when the file changes. Any thread may call.
 class FakePropertyListService final : public PropertyListService {
  public:
   // From now on the file of that path holds a property list with that root.
@@ -24,9 +27,12 @@ class FakePropertyListService final : public PropertyListService {
                                            std::optional<Error>& error) const override;
 
  private:
+  void set(std::string path, std::optional<Value> content);
+
   mutable std::mutex mutex_;
   std::string currentDirectory_ = "/current";
-  std::map<std::string, std::optional<Value>, std::less<>> files_;  // none: broken
+  std::map<std::string, std::size_t, std::less<>> files_;  // by path, the place of its content
+  std::vector<std::optional<Value>> contents_;             // all that there ever was; none: broken
 };
 
 }  // namespace halvox::platform

@@ -19,6 +19,18 @@ void FakeResultsFileService::failToOpen() {
   fails_ = true;
 }
 
+void FakeResultsFileService::failToOpen(std::string path) {
+  const std::lock_guard lock(mutex_);
+  unusable_.insert(std::move(path));
+}
+
+std::optional<FakeResultsFileService::File> FakeResultsFileService::finished(
+    const std::string& path) const {
+  const std::lock_guard lock(mutex_);
+  const auto file = finished_.find(path);
+  return file == finished_.end() ? std::nullopt : std::optional(*file->second);
+}
+
 std::vector<FakeResultsFileService::File> FakeResultsFileService::files() const {
   const std::lock_guard lock(mutex_);
   std::vector<File> result;
@@ -32,7 +44,7 @@ ResultsFileService::Writer FakeResultsFileService::sswriter_open(std::string_vie
                                                                  std::uint32_t flags) {
   journal_.note("results open");
   const std::lock_guard lock(mutex_);
-  if (fails_) return nullptr;
+  if (fails_ || unusable_.contains(path)) return nullptr;
   files_.push_back(
       std::make_shared<File>(File{std::string(path), std::string(productName), version, flags}));
   return std::make_unique<FakeWriter>(files_.back());
@@ -45,9 +57,12 @@ void FakeResultsFileService::sswriter_new_value(Sswriter& writer, std::string_vi
 }
 
 void FakeResultsFileService::sswriter_close(Writer writer) {
+  if (writer == nullptr) return;
   journal_.note("results close");
   const std::lock_guard lock(mutex_);
-  dynamic_cast<FakeWriter&>(*writer).file->isClosed = true;
+  const auto& file = dynamic_cast<FakeWriter&>(*writer).file;
+  file->isClosed = true;
+  finished_.insert_or_assign(file->path, file);
 }
 
 }  // namespace halvox::platform

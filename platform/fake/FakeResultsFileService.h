@@ -1,7 +1,10 @@
 #pragma once
 
+#include <map>
 #include <memory>
 #include <mutex>
+#include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -10,8 +13,8 @@
 
 namespace halvox::platform {
 
-// Keeps the results files that were written. Notes opening and closing in the journal. Any thread
-// may call.
+// Keeps the results files that were written. A file has its name, in the place of one that had it,
+// when it is closed. Notes opening and closing in the journal. Any thread may call.
 class FakeResultsFileService final : public ResultsFileService {
  public:
   struct Measurement {
@@ -34,7 +37,12 @@ class FakeResultsFileService final : public ResultsFileService {
 
   // From now on no file can be opened.
   void failToOpen();
+  // The same for that path alone.
+  void failToOpen(std::string path);
+  // All that were begun, in that order.
   [[nodiscard]] std::vector<File> files() const;
+  // The file that has the path; none when none was finished there.
+  [[nodiscard]] std::optional<File> finished(const std::string& path) const;
 
   Writer sswriter_open(std::string_view path, std::string_view productName, std::uint32_t version,
                        std::uint32_t flags) override;
@@ -46,6 +54,8 @@ class FakeResultsFileService final : public ResultsFileService {
   Journal& journal_;
   mutable std::mutex mutex_;
   bool fails_ = false;
+  std::set<std::string, std::less<>> unusable_;
+  std::map<std::string, std::shared_ptr<File>> finished_;
   std::vector<std::shared_ptr<File>> files_;
 };
 
