@@ -1,6 +1,5 @@
 #include "backends/HVReportingUtilityVEKStateManager.h"
 
-#include <optional>
 #include <utility>
 
 #include "backends/HVReportingUtility.h"
@@ -47,8 +46,9 @@ const LeakCounters& counters() {
 
 void HVReportingUtilityVEKStateManager::handleEvent(
     const platform::Message& message, AudioEventCategory category, AudioEventType type,
-    const std::shared_ptr<HVReportingSession>& session, std::string_view processName) {
-  if (type != AudioEventType::kJoulebook || !message.has_value()) return;
+    const std::shared_ptr<HVReportingSession>& session,
+    std::optional<std::string_view> processName) {
+  if (!concerns(type) || !message.has_value()) return;
   static const Key activeTime("Haptic_Active_Hardware_Time_Seconds");
   if (message->find(activeTime) == nullptr) return;
   counters().received.add();
@@ -62,14 +62,14 @@ void HVReportingUtilityVEKStateManager::handleEvent(
     return;
   }
   setMessageCache(*message);
-  kLog.info("Incrementing VEK counter. ", processName);
+  kLog.info("Incrementing VEK counter. ", processName.value_or("(null)"));
   setLeakedHapticsSessionCounter(leakedHapticsSessionCounter() + 1);
   counters().counted.add();
 }
 
 void HVReportingUtilityVEKStateManager::takeSnapshot(AudioEventCategory category,
                                                      const HVReportingSession& session,
-                                                     std::string_view processName) {
+                                                     std::optional<std::string_view> processName) {
   kLog.info("Getting snapshot with Ailment Reporter");
   const Reporter reporter = platform::diagnosticReporters().createReporter();
   setAilmentReporter(reporter);

@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string_view>
 
 #include "backends/HVReportingVocabulary.h"
@@ -35,12 +36,18 @@ class HVReportingUtilityVEKStateManager {
   HVReportingUtilityVEKStateManager(const HVReportingUtilityVEKStateManager&) = delete;
   HVReportingUtilityVEKStateManager& operator=(const HVReportingUtilityVEKStateManager&) = delete;
 
-  // Handles a message that the process `processName` sent through `session`, which must not be
-  // null. Ignores messages that do not report a session left running (type kJoulebook with the
-  // active time). Does not block: the reply of the snapshot comes later, on another thread.
+  // Returns true if a message of this type can report a session left running. The name of the
+  // sender is used for these messages only.
+  [[nodiscard]] static bool concerns(AudioEventType type) {
+    return type == AudioEventType::kJoulebook;
+  }
+  // Handles a message that the process `processName` (null: unknown) sent through `session`, which
+  // must not be null. Ignores messages that do not report a session left running (a type that
+  // concerns it, with the active time). Does not block: the reply of the snapshot comes later, on
+  // another thread.
   void handleEvent(const platform::Message& message, AudioEventCategory category,
                    AudioEventType type, const std::shared_ptr<HVReportingSession>& session,
-                   std::string_view processName);
+                   std::optional<std::string_view> processName);
 
   // The number of distinct reports since the last snapshot.
   [[nodiscard]] std::uint64_t leakedHapticsSessionCounter() const;
@@ -54,7 +61,7 @@ class HVReportingUtilityVEKStateManager {
 
  private:
   void takeSnapshot(AudioEventCategory category, const HVReportingSession& session,
-                    std::string_view processName);
+                    std::optional<std::string_view> processName);
 
   std::atomic<std::uint64_t> leakedHapticsSessionCounter_{0};  // relaxed: orders with nothing
   mutable std::mutex mutex_;  // held only to copy or exchange the members below

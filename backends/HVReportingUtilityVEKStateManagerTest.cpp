@@ -36,7 +36,7 @@ class HVReportingUtilityVEKStateManagerTest : public testing::Test {
   }
 
   void handle(const Message& message, AudioEventType type = AudioEventType::kJoulebook,
-              std::string_view processName = "player") {
+              std::optional<std::string_view> processName = "player") {
     manager_.handleEvent(message, kSession, type, session_, processName);
   }
   std::size_t snapshots() const { return platform_.diagnosticReporters.requests().size(); }

@@ -88,7 +88,8 @@ class AbsentPowerLog final : public PowerLogService {
 class AbsentDiagnosticReporter final : public AILDiagnosticReporter {
  public:
   Dictionary makeSignature(std::string_view, std::string_view, std::string_view, std::string_view,
-                           std::string_view, const std::optional<Dictionary>&) const override {
+                           std::optional<std::string_view>,
+                           const std::optional<Dictionary>&) const override {
     return {};
   }
   void requestSnapshot(const Dictionary&, double, const std::optional<Dictionary>&,

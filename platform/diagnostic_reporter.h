@@ -16,10 +16,10 @@ class AILDiagnosticReporter {
 
   virtual ~AILDiagnosticReporter() = default;
 
-  // What identifies a kind of problem.
+  // What identifies a kind of problem. What is not known, or not given, is not in it.
   [[nodiscard]] virtual Dictionary makeSignature(
       std::string_view domain, std::string_view type, std::string_view subType,
-      std::string_view subtypeContext, std::string_view detectedProcess,
+      std::string_view subtypeContext, std::optional<std::string_view> detectedProcess,
       const std::optional<Dictionary>& triggerThresholdValues) const = 0;
   // Asks for a capture of diagnostics for the signature. The reply is called once, later, on a
   // thread of the service, with what became of it.

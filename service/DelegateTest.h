@@ -34,7 +34,7 @@ class TestDelegate : public HVReportingServiceDelegateProtocol {
   void handleEventForVEK(const platform::Message& /*message*/, AudioEventCategory /*category*/,
                          AudioEventType /*type*/,
                          const std::shared_ptr<HVReportingSession>& /*session*/,
-                         std::string_view /*processName*/) override {}
+                         std::optional<std::string_view> /*processName*/) override {}
   void noteSessionChange(const HVReportingClientServerInstance& /*client*/,
                          const std::shared_ptr<HVReportingSession>& /*session*/,
                          SessionChange /*change*/) override {}

@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "backends/HVReportingUtility.h"
+#include "backends/HVReportingUtilityVEKStateManager.h"
 #include "platform/connection.h"
 #include "platform/services.h"
 #include "platform/statistics.h"
@@ -26,6 +27,18 @@ const RequestCounters& counters() {
   static const RequestCounters made{statistics.counter(kPiece, "received"),
                                     statistics.counter(kPiece, "carried out")};
   return made;
+}
+
+// The name of the process that sends the message now being delivered; none when it has gone. A
+// process may change its name at any time, so the name is that of this moment, and it is looked up
+// for the messages only whose sender anything asks for: a look-up reads a file, about as much work
+// as all the rest of a message.
+std::optional<std::string> senderProcessName(AudioEventType type) {
+  if (!HVReportingUtilityVEKStateManager::concerns(type)) return std::nullopt;
+  if (!HVReportingUtilityIsInternalBuild()) return std::nullopt;
+  const platform::NSXPCConnection* connection = platform::connections().currentConnection();
+  if (connection == nullptr) return std::nullopt;
+  return HVReportingUtilityProcessNameForPID(connection->processIdentifier());
 }
 
 }  // namespace
@@ -123,10 +136,11 @@ void HVReportingClientServerInstance::sendMessage(platform::Message message,
                                                   AudioEventCategory category, AudioEventType type,
                                                   ReporterIDs reporterIDs, ErrorReply reply) {
   ResourceCharge charge(account_, message ? message->memorySize() : 0);
-  queueRequest(platform::JobWeight::kBrief,
-               [request = MessageRequest{std::move(message), category, type, std::move(reporterIDs),
-                                         senderProcessName(), std::move(reply), std::move(charge)}](
-                   auto& client) mutable { client.carryOutSend(request); });
+  queueRequest(
+      platform::JobWeight::kBrief,
+      [request = MessageRequest{std::move(message), category, type, std::move(reporterIDs),
+                                senderProcessName(type), std::move(reply), std::move(charge)}](
+          auto& client) mutable { client.carryOutSend(request); });
 }
 
 void HVReportingClientServerInstance::stopReportingSessionForID(ReporterID reporterID,
@@ -161,20 +175,6 @@ void HVReportingClientServerInstance::getAllReporters(ReportersReply reply) {
 void HVReportingClientServerInstance::killService(BoolReply /*reply*/) {
   kServiceLog.notice("DESTROYING SERVICE");
   platform::process().terminate(kKilledExitStatus);
-}
-
-// A look-up reads a file, which no message can afford; so a process is looked up once. That misses
-// a process that takes another program or another name later: its messages keep the name that it
-// had at the first one. Another process under the same pid cannot be mistaken for it, since a pid
-// is not given away while the process that opened the connection lives, and the connection ends
-// with it.
-HVReportingClientServerInstance::ProcessName HVReportingClientServerInstance::senderProcessName() {
-  const platform::NSXPCConnection* connection = platform::connections().currentConnection();
-  const platform::ProcessID pid = connection == nullptr ? 0 : connection->processIdentifier();
-  if (pid == senderName_.pid) return senderName_.name;
-  std::optional<std::string> name = HVReportingUtilityProcessNameForPID(pid);
-  senderName_ = {pid, name ? std::make_shared<const std::string>(*std::move(name)) : nullptr};
-  return senderName_.name;
 }
 
 }  // namespace halvox

@@ -77,26 +77,19 @@ class HVReportingClientServerInstance final
 
  private:
   using Delegate = std::shared_ptr<HVReportingServiceDelegateProtocol>;
-  using ProcessName = std::shared_ptr<const std::string>;  // null: unknown
-
   // One message on its way to the back-ends.
   struct MessageRequest {
     platform::Message message;
     AudioEventCategory category;
     AudioEventType type;
     ReporterIDs reporterIDs;
-    ProcessName senderProcessName;
+    std::optional<std::string> senderProcessName;  // none: unknown, or not used
     ErrorReply reply;
     ResourceCharge charge;  // for the message, until the request was carried out
-  };
-  struct SenderName {
-    platform::ProcessID pid = 0;
-    ProcessName name;
   };
 
   template <typename Work>
   void queueRequest(platform::JobWeight weight, Work work);
-  ProcessName senderProcessName();
 
   // The work of the requests, on the reporting queue.
   void carryOutCreate(ReporterID reporterID, const BoolReply& reply);
@@ -132,8 +125,7 @@ class HVReportingClientServerInstance final
   const std::shared_ptr<ResourceAccount> account_ = std::make_shared<ResourceAccount>();
   Guarded<std::optional<platform::Date>> clientStartDate_;
   Guarded<std::optional<std::string>> clientProcessName_;
-  SessionMap sessions_;    // reporting queue only
-  SenderName senderName_;  // connection's thread only
+  SessionMap sessions_;  // reporting queue only
 };
 
 }  // namespace halvox

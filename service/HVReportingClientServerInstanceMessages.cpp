@@ -18,8 +18,6 @@ constexpr std::string_view kErrorDomain = "com.tarno.audio.reporting";
 constexpr std::int64_t kReportingDisabled = 1;
 // What messages that come outside any session are sent as.
 constexpr ReporterID kStandaloneReporterID{1};
-// The name of a sender that was gone before it could be looked up.
-constexpr std::string_view kUnknownProcess = "unknown";
 
 // received = delivered + dropped + refused.
 struct MessageCounters {
@@ -150,8 +148,7 @@ void HVReportingClientServerInstance::handToBackEnds(const MessageRequest& reque
   HVReportingTallyhubBridge::handleEvent(message, category, type, session);
   HVReportingJoulebookUtility::handleEvent(message, category, type, session);
   HVReportingZUBBridge::handleEvent(message, category, type, session);
-  delegate->handleEventForVEK(message, category, type, session,
-                              senderName == nullptr ? kUnknownProcess : *senderName);
+  delegate->handleEventForVEK(message, category, type, session, senderName);
 }
 
 }  // namespace halvox

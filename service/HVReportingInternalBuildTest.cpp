@@ -114,14 +114,48 @@ TEST_F(HVReportingInternalBuildTest, StandaloneLeaksCountOnceEach) {
   EXPECT_EQ(*requests()[0].signature.find("type"), Value("standalone"));
 }
 
-TEST_F(HVReportingInternalBuildTest, ASenderThatWasGoneIsUnknown) {
+TEST_F(HVReportingInternalBuildTest, ASenderThatWasGoneHasNoName) {
   const Connection gone = connectUnregistered(200, "brief");
   platform_.process.removeProcess(200);
   run();
 
   report(gone, 30, {});
+  report(gone, 31, {});
 
-  EXPECT_TRUE(platform_.log.containsText("Incrementing VEK counter. unknown"));
+  EXPECT_TRUE(platform_.log.containsText("Incrementing VEK counter. (null)"));
+  ASSERT_EQ(requests().size(), 1U);
+  EXPECT_EQ(requests()[0].signature.find("detectedProcess"), nullptr);
+}
+
+TEST_F(HVReportingInternalBuildTest, ASenderHasTheNameThatItHasWhenItSends) {
+  reportToSeven(30);
+  platform_.process.addProcess(100, "renamed");
+
+  reportToSeven(31);
+
+  ASSERT_EQ(requests().size(), 1U);
+  EXPECT_EQ(*requests()[0].signature.find("detectedProcess"), Value("renamed"));
+}
+
+TEST_F(HVReportingInternalBuildTest, TheSenderIsLookedUpBeforeItsMessageIsQueued) {
+  const std::size_t before = platform_.process.lookUps();
+
+  post(client_, "sendMessage",
+       {Dictionary{}, kCategoryOfLeak, std::uint16_t{8}, platform::Array{}});
+  EXPECT_EQ(platform_.process.lookUps(), before + 1);
+  platform_.process.addProcess(100, "too late");
+  run();
+
+  EXPECT_EQ(platform_.process.lookUps(), before + 1);
+}
+
+TEST_F(HVReportingInternalBuildTest, TheSenderOfAMessageThatNothingCapturesIsNotLookedUp) {
+  const std::size_t before = platform_.process.lookUps();
+
+  call(client_, "sendMessage",
+       {Dictionary{{"a", 1}}, kCategoryOfLeak, std::uint16_t{1}, platform::Array{}});
+
+  EXPECT_EQ(platform_.process.lookUps(), before);
 }
 
 }  // namespace

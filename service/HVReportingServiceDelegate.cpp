@@ -193,7 +193,8 @@ void HVReportingServiceDelegate::noteSessionChange(
 
 void HVReportingServiceDelegate::handleEventForVEK(
     const platform::Message& message, AudioEventCategory category, AudioEventType type,
-    const std::shared_ptr<HVReportingSession>& session, std::string_view processName) {
+    const std::shared_ptr<HVReportingSession>& session,
+    std::optional<std::string_view> processName) {
   if (!HVReportingUtilityIsInternalBuild()) return;
   vekStateManager_->handleEvent(message, category, type, session, processName);
 }

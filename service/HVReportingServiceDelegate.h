@@ -69,7 +69,7 @@ class HVReportingServiceDelegate final
   void sendDriverLogsForSession(const std::shared_ptr<HVReportingSession>& session) override;
   void handleEventForVEK(const platform::Message& message, AudioEventCategory category,
                          AudioEventType type, const std::shared_ptr<HVReportingSession>& session,
-                         std::string_view processName) override;
+                         std::optional<std::string_view> processName) override;
 
   // Null on builds that are not internal.
   [[nodiscard]] HVReportingUtilityVEKStateManager* vekStateManager() const {

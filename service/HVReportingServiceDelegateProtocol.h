@@ -55,12 +55,12 @@ class HVReportingServiceDelegateProtocol {
   // Sends what the drivers counted since the session's snapshot, through it and to the analytics
   // service. Waits as above.
   virtual void sendDriverLogsForSession(const std::shared_ptr<HVReportingSession>& session) = 0;
-  // Hands a message of a session, that a process of that name sent, to the bug capture; does
-  // nothing on builds that are not internal.
+  // Hands a message of a session, that a process of that name sent, to the bug capture; the name is
+  // null when it is not known. Does nothing on builds that are not internal.
   virtual void handleEventForVEK(const platform::Message& message, AudioEventCategory category,
                                  AudioEventType type,
                                  const std::shared_ptr<HVReportingSession>& session,
-                                 std::string_view processName) = 0;
+                                 std::optional<std::string_view> processName) = 0;
   // Clients tell of every change of their sessions, so that the look-ups above need not walk all
   // clients. Without effect for a client that is not in the list.
   virtual void noteSessionChange(const HVReportingClientServerInstance& client,

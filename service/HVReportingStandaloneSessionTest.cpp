@@ -14,7 +14,7 @@ class KeepingDelegate final : public TestDelegate {
   void handleEventForVEK(const platform::Message& message, AudioEventCategory /*category*/,
                          AudioEventType /*type*/,
                          const std::shared_ptr<HVReportingSession>& session,
-                         std::string_view /*processName*/) override {
+                         std::optional<std::string_view> /*processName*/) override {
     if (journal != nullptr) journal->note("bug capture");
     messages.push_back(message);
     sessions.push_back(session);

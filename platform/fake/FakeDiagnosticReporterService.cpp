@@ -18,13 +18,14 @@ class FakeDiagnosticReporterService::Reporter final : public AILDiagnosticReport
   explicit Reporter(std::shared_ptr<Requests> requests) : requests_(std::move(requests)) {}
 
   Dictionary makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
-                           std::string_view subtypeContext, std::string_view detectedProcess,
+                           std::string_view subtypeContext,
+                           std::optional<std::string_view> detectedProcess,
                            const std::optional<Dictionary>& triggerThresholdValues) const override {
     Dictionary signature{{"domain", domain},
                          {"type", type},
                          {"subType", subType},
-                         {"subtypeContext", subtypeContext},
-                         {"detectedProcess", detectedProcess}};
+                         {"subtypeContext", subtypeContext}};
+    if (detectedProcess.has_value()) signature.set("detectedProcess", *detectedProcess);
     if (triggerThresholdValues.has_value()) {
       signature.set("triggerThresholdValues", *triggerThresholdValues);
     }

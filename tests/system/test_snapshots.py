@@ -93,6 +93,21 @@ class Snapshots(unittest.TestCase):
             "DetectedProcess": OWN_NAME,
         })
 
+    def test_a_sender_that_renames_itself_is_reported_under_its_new_name(self):
+        service = self.service(INTERNAL)
+        haptics = HapticsClient(service)
+        name = Path("/proc/self/comm")
+        self.addCleanup(name.write_text, OWN_NAME)
+        haptics.send(report(1))
+        wait_for("the counted report", lambda: f"Incrementing VEK counter. {OWN_NAME}" in service.log())
+
+        name.write_text("renamed player")
+        haptics.send(report(2))
+
+        wait_for("an answer", lambda: answers(service) == 1)
+        signature = self.content(snapshots(service)[0], "signature.json")
+        self.assertEqual(signature["DetectedProcess"], "renamed player")
+
     def test_archive_tells_the_state_of_the_service_and_of_the_process(self):
         require("tar", "zstd")
         service = self.service(INTERNAL)

@@ -227,13 +227,16 @@ class SnapshotDiagnosticReporterService::Reporter final : public AILDiagnosticRe
   explicit Reporter(std::shared_ptr<Worker> worker) : worker_(std::move(worker)) {}
 
   Dictionary makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
-                           std::string_view subtypeContext, std::string_view detectedProcess,
+                           std::string_view subtypeContext,
+                           std::optional<std::string_view> detectedProcess,
                            const std::optional<Dictionary>& triggerThresholdValues) const override {
     Dictionary signature{{signature_key::kDomain, domain},
                          {signature_key::kType, type},
                          {signature_key::kSubType, subType},
-                         {signature_key::kSubtypeContext, subtypeContext},
-                         {signature_key::kDetectedProcess, detectedProcess}};
+                         {signature_key::kSubtypeContext, subtypeContext}};
+    if (detectedProcess.has_value()) {
+      signature.set(signature_key::kDetectedProcess, *detectedProcess);
+    }
     if (triggerThresholdValues.has_value()) {
       signature.set(signature_key::kTriggerThresholdValues, *triggerThresholdValues);
     }
