@@ -159,7 +159,8 @@ class HalvoxConnection {
   Result<bool> destroyReportingSession(ReporterID id);
   Result<Dictionary> reporterIDValid(ReporterID id);
   Result<std::vector<ReporterID>> getAllReporters();
-  // The service ends without an answer; true when the connection ended.
+  // The service ends without an answer; true when the connection ended. Refused unless this process
+  // is root's or that of the user whom the service runs as.
   Result<bool> killService();
 
  private:

@@ -61,8 +61,13 @@ struct Invocation {
 // are held for the client; those that make a session also while it has too many of these.
 enum class MethodEffect : std::uint8_t { kMayHoldMore, kHoldsNoMore, kMakesSession };
 
-// One method of an interface: its name, the D-Bus signatures of what goes in and out, and the
-// function that hands a request to the object. `invoke` runs on the connection's thread.
+// Who may make a request. The connection decides by what the system says about the other end; a
+// request that is not allowed is answered with org.freedesktop.DBus.Error.AccessDenied, and the
+// object never sees it. The owner is the user that the service runs as, and root.
+enum class MethodAccess : std::uint8_t { kAnybody, kOwner };
+
+// One method of an interface: its name, the D-Bus signatures of what goes in and out, the function
+// that hands a request to the object, and who may ask. `invoke` runs on the connection's thread.
 struct InterfaceMethod {
   std::string_view name;
   std::string_view in;
@@ -72,6 +77,7 @@ struct InterfaceMethod {
   // How many reporter IDs a request names; null for a method that takes no list of them. The
   // connection layer refuses a request that names more than it is configured for.
   std::size_t (*reporterIDs)(std::span<const Value> arguments) = nullptr;
+  MethodAccess access = MethodAccess::kAnybody;
 };
 
 // A protocol that objects export. Made of constants; lives as long as the process.

@@ -15,6 +15,7 @@ using platform::Error;
 using platform::ExportedObject;
 using platform::InterfaceMethod;
 using platform::Invocation;
+using platform::MethodAccess;
 using platform::MethodEffect;
 using platform::ReplyCallback;
 using platform::Value;
@@ -161,7 +162,8 @@ constexpr std::array kMethods{
     InterfaceMethod{"destroyReportingSession", "x", "b", kNoMore, invokeDestroy},
     InterfaceMethod{"reporterIDValid", "x", "a{sv}", kNoMore, invokeReporterIDValid},
     InterfaceMethod{"getAllReporters", "", "ax", kNoMore, invokeGetAllReporters},
-    InterfaceMethod{"killService", "", "b", kNoMore, invokeKillService},
+    InterfaceMethod{"killService", "", "b", kNoMore, invokeKillService, nullptr,
+                    MethodAccess::kOwner},
 };
 
 }  // namespace

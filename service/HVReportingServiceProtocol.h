@@ -49,7 +49,7 @@ class HVReportingServiceProtocol : public platform::ExportedObject {
   virtual void reporterIDValid(ReporterID reporterID, DictionaryReply reply) = 0;
   // Answers the IDs of all sessions of all clients.
   virtual void getAllReporters(ReportersReply reply) = 0;
-  // Ends the service at once. Never replies.
+  // Ends the service at once. Never replies. Connections deliver it from the service's owner only.
   virtual void killService(BoolReply reply) = 0;
 };
 

@@ -26,6 +26,7 @@ constexpr UnitLog kLog(mainCategory, "LinuxPlatform");
 ConnectionOptions connectionOptions(const Configuration& configuration) {
   ConnectionOptions options;
   options.socket = configuration.listener.socket;
+  options.socketAccess = {configuration.listener.mode, configuration.listener.group};
   options.bus = configuration.listener.bus;
   options.handshakeTimeout = configuration.listener.handshakeTimeout;
   options.messageTimeout = configuration.listener.messageTimeout;
@@ -84,7 +85,10 @@ int exitStatus(StoreError::Kind kind) {
 int exitStatus(ConnectionOpenError::Kind kind) {
   switch (kind) {
     case ConnectionOpenError::Kind::kPathTooLong:
+    case ConnectionOpenError::Kind::kUnknownGroup:
       return EX_CONFIG;
+    case ConnectionOpenError::Kind::kNotPermitted:
+      return EX_NOPERM;
     case ConnectionOpenError::Kind::kDirectoryMissing:
     case ConnectionOpenError::Kind::kDirectoryNotWritable:
     case ConnectionOpenError::Kind::kNotASocket:

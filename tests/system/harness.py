@@ -35,6 +35,8 @@ INTERFACE = "com.tarno.halvox.HVReportingServiceProtocol"
 WITH_US = ["setpriv", "--pdeathsig", "KILL", "--"]
 DEADLINE = 30.0  # seconds; generous, for sanitizer builds on a busy machine
 
+NOBODY = 65534  # another user than whoever runs the tests
+
 PLAYBACK = 4
 START, STOP = 1, 2
 
@@ -64,6 +66,26 @@ def stop_process(process, signal_number=signal.SIGTERM, deadline=DEADLINE):
     return process.returncode
 
 
+@contextlib.contextmanager
+def as_user(uid):
+    """What happens within is done as that user, who is in the group of the same number only."""
+    groups = os.getgroups()
+    os.setgroups([])
+    os.setegid(uid)
+    os.seteuid(uid)
+    try:
+        yield
+    finally:
+        os.seteuid(0)
+        os.setegid(0)
+        os.setgroups(groups)
+
+
+def setpriv_to(uid):
+    """A command line's beginning: the rest runs as that user and ends with us."""
+    return ["setpriv", "--pdeathsig", "KILL", f"--reuid={uid}", f"--regid={uid}", "--clear-groups", "--"]
+
+
 class NotifySocket:
     """Where the service says READY=1, as it does for systemd."""
 
@@ -73,6 +95,7 @@ class NotifySocket:
             os.unlink(self.path)
         self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
         self._socket.bind(self.path)
+        os.chmod(self.path, 0o666)  # a service of another user says it too
 
     def wait_ready(self, process, log_path, deadline=DEADLINE):
         end = time.monotonic() + deadline
@@ -92,7 +115,8 @@ class NotifySocket:
 class Service:
     """The built service with its own directories. Use as a context manager or call stop()."""
 
-    def __init__(self, config="", bus="none", environment=None, directory=None, command=None):
+    def __init__(self, config="", bus="none", environment=None, directory=None, command=None,
+                 listener=""):
         self.directory = Path(directory or tempfile.mkdtemp(prefix="halvox-test-"))
         self._owns_directory = directory is None
         self.socket = self.directory / "reporting.sock"
@@ -101,7 +125,7 @@ class Service:
         self.log_path = self.directory / "service.log"
         # Tests add tables of their own; the two that every test needs are put together here.
         self.config.write_text(
-            f'[listener]\nsocket = "{self.socket}"\nbus = "{bus}"\n'
+            f'[listener]\nsocket = "{self.socket}"\nbus = "{bus}"\n{listener}'
             + ("" if "[storage]" in config else f'[storage]\ndirectory = "{self.directory / "state"}"\n')
             + config
         )
@@ -365,13 +389,26 @@ def to_variant(value):
 
 
 @contextlib.contextmanager
-def private_bus():
-    """A message bus of our own; gives its address."""
+def private_bus(configuration=None, options=(), environment=None, open_to_all=False):
+    """A message bus of our own; gives its address. The configuration is what stands in its file
+    besides the address and the rules, by default the usual one of a session."""
     directory = tempfile.mkdtemp(prefix="halvox-bus-")
+    source = ["--session", f"--address=unix:path={directory}/bus"]
+    if configuration is not None or open_to_all:
+        file = Path(directory) / "bus.conf"
+        users = '<allow user="*"/>' if open_to_all else ""
+        file.write_text(
+            f"<busconfig><type>session</type><listen>unix:path={directory}/bus</listen>"
+            f"<auth>EXTERNAL</auth>{configuration or ''}<policy context='default'>{users}"
+            "<allow send_destination='*' eavesdrop='true'/><allow eavesdrop='true'/>"
+            "<allow own='*'/></policy></busconfig>")
+        source = [f"--config-file={file}"]
+    if open_to_all:
+        os.chmod(directory, 0o755)
     process = subprocess.Popen(
-        [*WITH_US, "dbus-daemon", "--session", "--nofork", "--print-address=1",
-         f"--address=unix:path={directory}/bus"],
+        [*WITH_US, "dbus-daemon", *source, "--nofork", "--print-address=1", *options],
         stdout=subprocess.PIPE, stderr=subprocess.DEVNULL, text=True,
+        env={**os.environ, **(environment or {})},
     )
     try:
         address = process.stdout.readline().strip()

@@ -179,9 +179,10 @@ void addRequestCommands(CommandSet& commands) {
   addBare<List>(commands, {.name = "list",
                            .summary = "List the reporter IDs of all sessions",
                            .example = "halvoxctl list --json"});
-  addBare<Kill>(commands, {.name = "kill",
-                           .summary = "End the service at once, without an answer or cleanup",
-                           .example = "halvoxctl kill"});
+  addBare<Kill>(commands,
+                {.name = "kill",
+                 .summary = "End the service at once, without cleanup; for root and its user",
+                 .example = "halvoxctl kill"});
 }
 
 void addScriptRequests(CommandSet& commands) {

@@ -16,6 +16,25 @@ namespace {
 
 constexpr UnitLog kLog{connectionCategory, "BusConnection"};
 
+// What the bus answers about a sender; unknown for what it does not tell, as about a sender that
+// has gone.
+PeerCredentials credentialsIn(const dbus::Frame& answer) {
+  std::vector<Value> values;
+  if (answer.header.type != dbus::MessageType::kMethodReturn ||
+      dbus::decodeBody(answer, "a{sv}", values).has_value()) {
+    return {};
+  }
+  PeerCredentials credentials;
+  const Dictionary facts = values[0].dictionary();
+  if (const Value* pid = facts.find("ProcessID"); pid != nullptr && pid->isNumber()) {
+    credentials.pid = static_cast<ProcessID>(pid->toInt64());
+  }
+  if (const Value* uid = facts.find("UnixUserID"); uid != nullptr && uid->isNumber()) {
+    credentials.uid = static_cast<uid_t>(uid->toUInt64());
+  }
+  return credentials;
+}
+
 }  // namespace
 
 BusConnection::BusConnection(ConnectionHost& host, BusSession session)
@@ -123,10 +142,7 @@ void BusConnection::handleAnswer(const dbus::Frame& frame) {
   const std::shared_ptr<BusSender> sender = found->second.lock();
   questions_.erase(found);
   if (!sender) return;
-  std::vector<Value> answer;
-  const bool isKnown = frame.header.type == dbus::MessageType::kMethodReturn &&
-                       !dbus::decodeBody(frame, "u", answer).has_value();
-  sender->onProcess(isKnown ? static_cast<ProcessID>(answer[0].toInt64()) : 0);
+  sender->onCredentials(credentialsIn(frame));
 }
 
 std::shared_ptr<BusSender> BusConnection::senderNamed(std::string_view name) {
@@ -138,7 +154,7 @@ std::shared_ptr<BusSender> BusConnection::senderNamed(std::string_view name) {
   const dbus::CallTarget target{.destination = bus_names::kBus,
                                 .path = bus_names::kBusPath,
                                 .interface = bus_names::kBus,
-                                .member = "GetConnectionUnixProcessID"};
+                                .member = "GetConnectionCredentials"};
   const std::uint32_t serial = stream_.nextSerial();
   if (dbus::appendMethodCall(stream_.output().bytes(), serial, target, "s", arguments)) {
     questions_.emplace(serial, sender);

@@ -15,7 +15,7 @@ constexpr UnitLog kLog{connectionCategory, "BusSender"};
 }  // namespace
 
 BusSender::BusSender(ConnectionHost& host, BusConnection& bus, std::string name)
-    : ClientConnection(host, host.nextClientNumber(), 0),
+    : ClientConnection(host, host.nextClientNumber(), {}),
       bus_(bus),
       name_(std::move(name)),
       input_(host.options().maxFrameBytes),
@@ -45,11 +45,11 @@ void BusSender::deliverReceived() {
   if (wantsInput()) deliver();
 }
 
-void BusSender::onProcess(ProcessID pid) {
+void BusSender::onCredentials(const PeerCredentials& credentials) {
   if (isKnown_ || hasEnded()) return;
   isKnown_ = true;
   identity_.stop();
-  setProcessIdentifier(pid);
+  setCredentials(credentials);
   if (!host().admit(shared_from_this())) return;
   deliverReceived();
 }

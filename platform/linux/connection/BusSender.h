@@ -12,10 +12,10 @@ namespace halvox::platform::linux_ {
 class BusConnection;
 
 // One sender on the bus, a connection of its own. Its requests come through the bus's connection
-// and wait here until the bus has told the sender's process and while the sender is held back. The
+// and wait here until the bus has said who the sender is and while the sender is held back. The
 // bus cannot be asked to hold one sender back, so what goes beyond kMaxWaitingBytesOfSender is
 // refused; what the sender does not read of its answers is kept, and bounded, by the bus.
-// A sender that is gone before the bus could tell its process is served with process 0.
+// A sender that is gone before the bus could say who it is is served as process 0 of no user.
 class BusSender final : public ClientConnection, private DeadlineOwner {
  public:
   BusSender(ConnectionHost& host, BusConnection& bus, std::string name);
@@ -29,8 +29,8 @@ class BusSender final : public ClientConnection, private DeadlineOwner {
   void receiveOversized(const FrameBuffer::Next& next);
   // Delivers what has been received, unless the sender has to wait.
   void deliverReceived();
-  // The bus has told the process, or cannot (0).
-  void onProcess(ProcessID pid);
+  // The bus has said who the sender is, as far as it knows.
+  void onCredentials(const PeerCredentials& credentials);
   // The bus says that nobody has the name any more.
   void onVanished();
   void onBusLost();
@@ -46,7 +46,7 @@ class BusSender final : public ClientConnection, private DeadlineOwner {
   void onEnded() override { identity_.stop(); }
   void onFinished() override;
   void onMalformed(const std::string& what) override;
-  void onDeadline() override { onProcess(0); }
+  void onDeadline() override { onCredentials({}); }
 
   BusConnection& bus_;
   std::string name_;

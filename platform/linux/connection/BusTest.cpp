@@ -1,7 +1,9 @@
 #include <array>
 #include <csignal>
 #include <cstdlib>
+#include <filesystem>
 #include <fstream>
+#include <optional>
 #include <string>
 #include <thread>
 
@@ -9,6 +11,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/linux/connection/ConnectionLimits.h"
+#include "platform/linux/connection/testing/AnotherUser.h"
 #include "platform/linux/connection/testing/BusClient.h"
 #include "platform/linux/connection/testing/ChildProcess.h"
 #include "platform/linux/connection/testing/RawClient.h"
@@ -30,6 +33,7 @@ constexpr const char* kBusConfiguration = R"(
   <listen>unix:path=SOCKET</listen>
   <auth>EXTERNAL</auth>
   <policy context="default">
+    <allow user="*"/>
     <allow send_destination="*" eavesdrop="true"/>
     <allow eavesdrop="true"/>
     <allow own="*"/>
@@ -46,6 +50,7 @@ class PrivateBus {
     configuration.replace(configuration.find(placeholder), placeholder.size(),
                           (directory_.path() / "bus").string());
     const std::string file = (directory_.path() / "bus.conf").string();
+    std::filesystem::permissions(directory_.path(), std::filesystem::perms(0755));
     std::ofstream(file) << configuration;
     daemon_.emplace(std::vector<std::string>{"dbus-daemon", "--config-file=" + file, "--nofork",
                                              "--print-address=1"});
@@ -95,6 +100,20 @@ TEST_F(BusTest, ProcessOfASenderIsKnownBeforeItIsAccepted) {
 
   EXPECT_EQ(client.call("pid").text, std::to_string(getpid()));
   EXPECT_THAT(service_.delegate.events(), ElementsAre(own("accepted")));
+}
+
+TEST_F(BusTest, WhatIsForTheOwnerIsRefusedToSendersOfOtherUsers) {
+  if (!AnotherUser::isPossible()) GTEST_SKIP() << "needs the right to become another user";
+  BusClient owner = connect();
+  std::optional<BusClient> other;
+  {
+    const AnotherUser user;
+    other.emplace(connect());
+  }
+
+  EXPECT_EQ(other->call("end").errorName, "org.freedesktop.DBus.Error.AccessDenied");
+  EXPECT_EQ(other->call("echo", "a").text, "a");
+  EXPECT_EQ(owner.call("end").text, "true");
 }
 
 TEST_F(BusTest, EverySenderIsAConnectionOfItsOwn) {

@@ -17,10 +17,11 @@ constexpr UnitLog kLog{connectionCategory, "ClientConnection"};
 
 }  // namespace
 
-ClientConnection::ClientConnection(ConnectionHost& host, std::uint64_t number, ProcessID pid)
+ClientConnection::ClientConnection(ConnectionHost& host, std::uint64_t number,
+                                   const PeerCredentials& credentials)
     : host_(host),
       number_(number),
-      pid_(pid),
+      credentials_(credentials),
       link_(std::make_shared<ClientLink>(host.inbox(), host.sharedStatistics())) {
   link_->attach(*this);
 }

@@ -11,6 +11,7 @@
 #include "platform/linux/connection/ClientLink.h"
 #include "platform/linux/connection/ConnectionStatistics.h"
 #include "platform/linux/connection/FrameBuffer.h"
+#include "platform/linux/connection/PeerCredentials.h"
 #include "platform/linux/connection/SocketStream.h"
 #include "platform/linux/connection/wire/Frame.h"
 
@@ -35,12 +36,12 @@ class ClientConnection : public NSXPCConnection,
   enum class Why : std::uint8_t { kPeerVanished, kClosedHere };
 
   // Does not own the host, which must outlive the connection's end.
-  ClientConnection(ConnectionHost& host, std::uint64_t number, ProcessID pid);
+  ClientConnection(ConnectionHost& host, std::uint64_t number, const PeerCredentials& credentials);
   ClientConnection(const ClientConnection&) = delete;
   ClientConnection& operator=(const ClientConnection&) = delete;
   ~ClientConnection() override = default;
 
-  [[nodiscard]] ProcessID processIdentifier() const override { return pid_; }
+  [[nodiscard]] ProcessID processIdentifier() const override { return credentials_.pid; }
   void setExportedInterface(const NSXPCInterface& interface) override;
   void setExportedObject(std::shared_ptr<ExportedObject> object) override;
   void setInterruptionHandler(std::function<void()> handler) override;
@@ -62,6 +63,7 @@ class ClientConnection : public NSXPCConnection,
 
   // For whoever answers requests.
   [[nodiscard]] std::uint64_t number() const { return number_; }
+  [[nodiscard]] const PeerCredentials& credentials() const { return credentials_; }
   [[nodiscard]] const NSXPCInterface* exportedInterface() const { return interface_; }
   [[nodiscard]] ExportedObject* exportedObject() const { return object_.get(); }
   [[nodiscard]] const std::shared_ptr<ClientLink>& link() const { return link_; }
@@ -101,7 +103,7 @@ class ClientConnection : public NSXPCConnection,
   [[nodiscard]] bool hasEnded() const { return state_ == State::kEnded; }
   [[nodiscard]] bool wantsInput() const { return state_ == State::kReading; }
   [[nodiscard]] ConnectionHost& host() { return host_; }
-  void setProcessIdentifier(ProcessID pid) { pid_ = pid; }
+  void setCredentials(const PeerCredentials& credentials) { credentials_ = credentials; }
 
  private:
   enum class State : std::uint8_t {
@@ -123,7 +125,7 @@ class ClientConnection : public NSXPCConnection,
 
   ConnectionHost& host_;
   std::uint64_t number_;
-  ProcessID pid_;
+  PeerCredentials credentials_;
   std::shared_ptr<ClientLink> link_;
   const NSXPCInterface* interface_ = nullptr;
   std::shared_ptr<ExportedObject> object_;

@@ -91,7 +91,7 @@ std::optional<ConnectionOpenError> ConnectionHost::openSockets() {
   if (auto* error = std::get_if<ConnectionOpenError>(&passed)) return std::move(*error);
   auto& sockets = std::get<std::vector<UniqueFd>>(passed);
   if (sockets.empty()) {
-    auto bound = listenOn(options_.socket);
+    auto bound = listenOn(options_.socket, options_.socketAccess);
     if (auto* error = std::get_if<ConnectionOpenError>(&bound)) return std::move(*error);
     socketFile_ = std::move(std::get<BoundSocket>(bound).file);
     sockets.push_back(std::move(std::get<BoundSocket>(bound).fd));

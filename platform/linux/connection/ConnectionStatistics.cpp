@@ -31,6 +31,8 @@ std::string_view nameOf(Refusal refusal) {
       return "message too large";
     case Refusal::kTooManyWaiting:
       return "too many waiting";
+    case Refusal::kNotAllowed:
+      return "not allowed";
   }
   return "unknown";
 }

@@ -21,8 +21,10 @@ enum class Refusal : std::uint8_t {
   kReporterIDLimit,
   kTooLarge,
   kTooManyWaiting,
+  kNotAllowed,
 };
-inline constexpr std::size_t kRefusalKinds = 10;
+// Counted from the last of them, so that two new ones cannot count as one.
+inline constexpr std::size_t kRefusalKinds = static_cast<std::size_t>(Refusal::kNotAllowed) + 1;
 
 // The refusal as the statistics name it.
 std::string_view nameOf(Refusal refusal);

@@ -5,6 +5,7 @@
 // The standard errors of D-Bus that requests are refused with.
 namespace halvox::platform::linux_::error_names {
 
+inline constexpr std::string_view kAccessDenied = "org.freedesktop.DBus.Error.AccessDenied";
 inline constexpr std::string_view kFailed = "org.freedesktop.DBus.Error.Failed";
 inline constexpr std::string_view kInvalidArgs = "org.freedesktop.DBus.Error.InvalidArgs";
 inline constexpr std::string_view kLimitsExceeded = "org.freedesktop.DBus.Error.LimitsExceeded";

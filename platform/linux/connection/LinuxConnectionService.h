@@ -22,9 +22,17 @@ class ListeningSocket;
 // Whether SIGTERM and SIGINT end the listener's resume().
 enum class EndSignals : std::uint8_t { kHandle, kLeaveAlone };
 
+// Who may connect to the socket's file.
+struct SocketAccess {
+  std::uint32_t mode = 0666;  // permission bits
+  std::string group;          // the file is given to this group; empty: left as it is made
+};
+
 // How connections are served.
 struct ConnectionOptions {
-  std::filesystem::path socket;  // not used when the service is started through a socket
+  // These two are not used when the service is started through a socket.
+  std::filesystem::path socket;
+  SocketAccess socketAccess;
   BusKind bus = BusKind::kNone;
   std::string busName = "com.tarno.halvox.reporting";
   std::chrono::milliseconds handshakeTimeout{30'000};
@@ -52,6 +60,8 @@ struct ConnectionOpenError {
     kDirectoryNotWritable,
     kAlreadyServed,  // somebody answers on that socket
     kNotASocket,     // a file of another kind is in the way
+    kUnknownGroup,   // the socket's group does not exist
+    kNotPermitted,   // the socket's file may not be given to its group
     kBadActivation,  // a descriptor that was passed is no listening stream socket
     kBusUnreachable,
     kBusNameTaken,

@@ -12,7 +12,7 @@
 #include "platform/linux/connection/ConnectionHost.h"
 #include "platform/linux/connection/ConnectionLimits.h"
 #include "platform/linux/connection/ConnectionLog.h"
-#include "platform/linux/connection/PeerConnection.h"
+#include "platform/linux/connection/PeerCredentials.h"
 
 namespace halvox::platform::linux_ {
 namespace {

@@ -14,8 +14,7 @@ constexpr UnitLog kLog{connectionCategory, "PeerConnection"};
 
 PeerConnection::PeerConnection(ConnectionHost& host, std::uint64_t number, UniqueFd fd,
                                const PeerCredentials& credentials)
-    : ClientConnection(host, number, credentials.pid),
-      uid_(credentials.uid),
+    : ClientConnection(host, number, credentials),
       stream_(std::move(fd), host, *this),
       handshake_(std::make_unique<dbus::ServerHandshake>(host.identity().guidHex, credentials.uid)),
       deadline_(*this) {}
@@ -27,7 +26,7 @@ void PeerConnection::start() {
 
 std::string PeerConnection::description() const {
   return "client " + std::to_string(number()) + " (pid " + std::to_string(processIdentifier()) +
-         ", uid " + std::to_string(uid_) + ")";
+         ", uid " + std::to_string(credentials().uid) + ")";
 }
 
 void PeerConnection::setReading(bool reading) {

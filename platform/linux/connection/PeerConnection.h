@@ -3,8 +3,7 @@
 #include <cstdint>
 #include <memory>
 #include <string>
-
-#include <sys/types.h>
+#include <string_view>
 
 #include "platform/linux/UniqueHandle.h"
 #include "platform/linux/connection/ClientConnection.h"
@@ -13,12 +12,6 @@
 #include "platform/linux/connection/wire/Handshake.h"
 
 namespace halvox::platform::linux_ {
-
-// Who is at the other end of a socket, as the kernel tells.
-struct PeerCredentials {
-  ProcessID pid = 0;
-  uid_t uid = 0;
-};
 
 // A client on a socket of its own. First the handshake, then requests; both must be finished in
 // time once they are begun, or the connection is closed with a line in the log. An idle connection
@@ -49,7 +42,6 @@ class PeerConnection final : public ClientConnection, private StreamOwner, priva
   // True when messages follow.
   bool continueHandshake();
 
-  uid_t uid_;
   SocketStream stream_;
   std::unique_ptr<dbus::ServerHandshake> handshake_;  // none once it is done
   Deadline deadline_;

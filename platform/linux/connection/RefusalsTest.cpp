@@ -1,6 +1,7 @@
 #include <array>
 #include <filesystem>
 #include <iterator>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -8,6 +9,7 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
+#include "platform/linux/connection/testing/AnotherUser.h"
 #include "platform/linux/connection/testing/BusClient.h"
 #include "platform/linux/connection/testing/RawClient.h"
 #include "platform/linux/connection/testing/ServiceUnderTest.h"
@@ -134,6 +136,34 @@ TEST(RefusalsTest, UnsupportedValueIsNamedWithItsKeyAndSignature) {
   EXPECT_THAT(error.message, HasSubstr("(ii)"));
   EXPECT_EQ(service.delegate.object->delivered, 0U);
   sd_bus_error_free(&error);
+}
+
+TEST(RefusalsTest, WhatIsForTheOwnerIsDeliveredFromRootAndTheServicesUser) {
+  ServiceUnderTest service;
+  BusClient client(service.address());
+
+  EXPECT_EQ(client.call("end").text, "true");
+  EXPECT_EQ(service.delegate.object->delivered, 1U);
+}
+
+TEST(RefusalsTest, WhatIsForTheOwnerIsRefusedToOthersWhoMayDoAllElse) {
+  if (!AnotherUser::isPossible()) GTEST_SKIP() << "needs the right to become another user";
+  ServiceUnderTest service;
+  std::filesystem::permissions(service.socketPath().parent_path(), std::filesystem::perms(0755));
+  std::optional<BusClient> client;
+  {
+    const AnotherUser other;
+    client.emplace(service.address());
+  }
+
+  const BusAnswer refused = client->call("end");
+
+  EXPECT_EQ(refused.errorName, standardError("AccessDenied"));
+  EXPECT_THAT(refused.errorText, HasSubstr("\"end\""));
+  EXPECT_THAT(refused.errorText, HasSubstr("uid 65534"));
+  EXPECT_EQ(service.delegate.object->delivered, 0U);
+  EXPECT_EQ(service.count("requests refused: not allowed"), 1U);
+  EXPECT_EQ(client->call("echo", "a").text, "a");
 }
 
 TEST(RefusalsTest, RefusalsOfOneKindAreLoggedOnceAConnectionAndCounted) {

@@ -4,6 +4,8 @@
 #include <string_view>
 #include <utility>
 
+#include <unistd.h>
+
 #include "platform/linux/connection/ClientConnection.h"
 #include "platform/linux/connection/CurrentDelivery.h"
 #include "platform/linux/connection/ErrorNames.h"
@@ -89,6 +91,7 @@ void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& fr
 }
 
 void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& method) {
+  if (method.access == MethodAccess::kOwner && isForbidden(request, method)) return;
   if (method.effect != MethodEffect::kHoldsNoMore && isOverLimits(request, method)) return;
   if (!decode(request, method.in)) return;
   if (namesTooManyReporters(request, method)) {
@@ -106,6 +109,18 @@ void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& m
                   Invocation{.arguments = arguments_, .reply = std::move(reply)});
   }
   arguments_.clear();
+}
+
+bool RequestDispatcher::isForbidden(const Request& request, const InterfaceMethod& method) {
+  constexpr uid_t kRoot = 0;
+  const uid_t owner = geteuid();
+  const uid_t user = request.client.credentials().uid;
+  if (user != kUnknownUser && (user == owner || user == kRoot)) return false;
+  const std::string who = user == kUnknownUser ? "an unknown user" : "uid " + std::to_string(user);
+  request.client.refuse(request.header(), Refusal::kNotAllowed, error_names::kAccessDenied,
+                        quoted(method.name) + ": only root and the service's own user (uid " +
+                            std::to_string(owner) + ") may ask for this, the client is " + who);
+  return true;
 }
 
 // The bytes of a request count from its delivery on, so a client can pass that bound by what one

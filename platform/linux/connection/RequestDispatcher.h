@@ -28,6 +28,7 @@ class RequestDispatcher {
   struct Request;
 
   void deliver(const Request& request, const InterfaceMethod& method);
+  [[nodiscard]] bool isForbidden(const Request& request, const InterfaceMethod& method);
   [[nodiscard]] bool isOverLimits(const Request& request, const InterfaceMethod& method);
   [[nodiscard]] bool namesTooManyReporters(const Request& request, const InterfaceMethod& method);
   void answerStandard(const Request& request, const StandardMethod& method);

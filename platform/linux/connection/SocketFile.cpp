@@ -7,17 +7,17 @@
 #include <utility>
 
 #include <fcntl.h>
+#include <grp.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
 #include <systemd/sd-daemon.h>
+#include <unistd.h>
 
 namespace halvox::platform::linux_ {
 namespace {
 
 using Kind = ConnectionOpenError::Kind;
-
-constexpr mode_t kAnybodyMayConnect = 0666;
 
 std::string systemError(int error) { return std::generic_category().message(error); }
 
@@ -77,6 +77,59 @@ ConnectionOpenError bindFailure(const std::filesystem::path& path, int error) {
   }
 }
 
+// The number of a group; none when there is none of that name, or an error number.
+std::variant<std::optional<gid_t>, int> findGroup(const std::string& name) {
+  constexpr std::size_t kLargestEntry = std::size_t{1} << 24U;
+  group entry{};
+  group* found = nullptr;
+  std::vector<char> buffer(4096);
+  int error = 0;
+  do {
+    error = getgrnam_r(name.c_str(), &entry, buffer.data(), buffer.size(), &found);
+    if (error == ERANGE) buffer.resize(2 * buffer.size());
+  } while (error == EINTR || (error == ERANGE && buffer.size() <= kLargestEntry));
+  if (found != nullptr) return found->gr_gid;
+  if (error == 0 || error == ENOENT || error == ESRCH) return std::nullopt;
+  return error;
+}
+
+std::optional<ConnectionOpenError> giveToGroup(const std::filesystem::path& path,
+                                               const std::string& name) {
+  const auto looked = findGroup(name);
+  const std::string quoted = '"' + name + '"';
+  if (const int* error = std::get_if<int>(&looked)) {
+    return failure(
+        Kind::kSystem, path,
+        "the group " + quoted + " of listener.group cannot be looked up: " + systemError(*error));
+  }
+  const std::optional<gid_t> id = std::get<std::optional<gid_t>>(looked);
+  if (!id.has_value()) {
+    return ConnectionOpenError{
+        .kind = Kind::kUnknownGroup,
+        .description = "listener.group: expected a group of this system, found " + quoted};
+  }
+  constexpr uid_t kSameUser = static_cast<uid_t>(-1);
+  if (fchownat(AT_FDCWD, path.c_str(), kSameUser, *id, AT_SYMLINK_NOFOLLOW) == 0) {
+    return std::nullopt;
+  }
+  return failure(errno == EPERM ? Kind::kNotPermitted : Kind::kSystem, path,
+                 "cannot give it to the group " + quoted + " of listener.group: " +
+                     systemError(errno) + "; only root and members of a group may");
+}
+
+// Nobody can connect to a socket before it listens. So the file gets its group and its mode first,
+// and the mode after the group: the members of the old group must not get in either.
+std::optional<ConnectionOpenError> letIn(const std::filesystem::path& path,
+                                         const SocketAccess& access) {
+  if (!access.group.empty()) {
+    if (auto error = giveToGroup(path, access.group)) return error;
+  }
+  if (chmod(path.c_str(), access.mode) != 0) {
+    return failure(Kind::kSystem, path, "cannot set its permissions: " + systemError(errno));
+  }
+  return std::nullopt;
+}
+
 }  // namespace
 
 SocketFile::SocketFile(std::filesystem::path path) : path_(std::move(path)) {
@@ -109,7 +162,8 @@ void SocketFile::remove() noexcept {
   path_.clear();
 }
 
-std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path) {
+std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
+                                                        const SocketAccess& access) {
   const std::optional<sockaddr_un> address = addressOf(path);
   if (!address.has_value()) {
     return failure(Kind::kPathTooLong, path,
@@ -124,7 +178,8 @@ std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::p
   const auto* generic = reinterpret_cast<const sockaddr*>(&*address);
   if (bind(bound.fd.get(), generic, sizeof *address) != 0) return bindFailure(path, errno);
   bound.file = SocketFile(path);
-  if (chmod(path.c_str(), kAnybodyMayConnect) != 0 || listen(bound.fd.get(), SOMAXCONN) != 0) {
+  if (auto error = letIn(path, access)) return *std::move(error);
+  if (listen(bound.fd.get(), SOMAXCONN) != 0) {
     return failure(Kind::kSystem, path, systemError(errno));
   }
   return bound;

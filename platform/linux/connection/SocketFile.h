@@ -37,9 +37,11 @@ struct BoundSocket {
   SocketFile file;
 };
 
-// Makes the socket at `path`, which any process may connect to. A socket file that nobody serves
-// any more is replaced; any other file is left alone. Blocks for no longer than a connect does.
-std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path);
+// Makes the socket at `path`. At no time can anybody connect whom `access` keeps out. A socket file
+// that nobody serves any more is replaced; any other file is left alone. Blocks for no longer than
+// a connect and a look-up of the group do.
+std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
+                                                        const SocketAccess& access = {});
 
 // The sockets that the service was started through; none when it was started otherwise. Later
 // calls give none, and child processes do not inherit them.

@@ -1,5 +1,6 @@
 #include "platform/linux/connection/SocketFile.h"
 
+#include <csignal>
 #include <cstring>
 #include <filesystem>
 #include <fstream>
@@ -39,6 +40,64 @@ TEST_F(SocketFileTest, AnybodyMayConnect) {
   ASSERT_TRUE(std::holds_alternative<BoundSocket>(bound));
   const auto permissions = std::filesystem::status(socketPath()).permissions();
   EXPECT_EQ(static_cast<unsigned>(permissions) & 0777U, 0666U);
+}
+
+TEST_F(SocketFileTest, OnlyThoseMayConnectWhomTheModeLetsIn) {
+  const mode_t before = umask(0);
+
+  const auto bound = listenOn(socketPath(), {.mode = 0640, .group = {}});
+
+  umask(before);
+  ASSERT_TRUE(std::holds_alternative<BoundSocket>(bound));
+  const auto permissions = std::filesystem::status(socketPath()).permissions();
+  EXPECT_EQ(static_cast<unsigned>(permissions) & 0777U, 0640U);
+}
+
+TEST_F(SocketFileTest, UnknownGroupIsToldAndNoFileIsLeft) {
+  const auto result = listenOn(socketPath(), {.mode = 0660, .group = "no such group"});
+
+  EXPECT_EQ(kindOf(result), Kind::kUnknownGroup);
+  EXPECT_NE(std::get<ConnectionOpenError>(result).description.find("\"no such group\""),
+            std::string::npos);
+  EXPECT_FALSE(std::filesystem::exists(socketPath()));
+}
+
+// In the background: connects until it got in, which ends the process with status 1, or until it is
+// killed. Needs the rights of root, which it gives up.
+pid_t startIntruder(const path& socket) {
+  const pid_t child = fork();
+  if (child != 0) return child;
+  constexpr uid_t kNobody = 65534;
+  if (setresgid(kNobody, kNobody, kNobody) != 0 || setresuid(kNobody, kNobody, kNobody) != 0) {
+    _exit(2);
+  }
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  socket.native().copy(address.sun_path, sizeof address.sun_path - 1);
+  for (;;) {
+    const UniqueFd fd(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    const auto* generic = reinterpret_cast<const sockaddr*>(&address);
+    if (connect(fd.get(), generic, sizeof address) == 0) _exit(1);
+  }
+}
+
+TEST_F(SocketFileTest, NobodyWhomTheModeKeepsOutGetsInWhileTheSocketIsMade) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs the right to become another user";
+  constexpr int kRounds = 2000;
+  std::filesystem::permissions(directory_.path(), std::filesystem::perms(0755));
+  const mode_t before = umask(0);
+  const pid_t intruder = startIntruder(socketPath());
+
+  for (int round = 0; round < kRounds; ++round) {
+    ASSERT_TRUE(
+        std::holds_alternative<BoundSocket>(listenOn(socketPath(), {.mode = 0600, .group = {}})));
+  }
+
+  umask(before);
+  int status = 0;
+  EXPECT_EQ(waitpid(intruder, &status, WNOHANG), 0) << "the intruder got in";
+  kill(intruder, SIGKILL);
+  waitpid(intruder, &status, 0);
 }
 
 TEST_F(SocketFileTest, FileIsRemovedAtTheEnd) {

@@ -76,8 +76,38 @@ std::variant<std::optional<std::string>, ConfigurationError> readText(
                           kLargestFile))};
 }
 
+bool isNotEmpty(std::string_view text) { return !text.empty(); }
+
+// Three octal digits after a zero, with which the owner may connect.
+bool isMode(std::string_view text) {
+  return text.size() == 4 && text[0] == '0' && (text[1] == '6' || text[1] == '7') &&
+         std::ranges::all_of(text, [](char digit) { return digit >= '0' && digit <= '7'; });
+}
+
+// Who may connect when the file does not say: the members of a group that it names; nobody else
+// when the socket is among the files of a login; every user to a service of the system, because
+// every user's programs report.
+std::uint32_t defaultMode(const Configuration::Listener& listener) {
+  constexpr std::uint32_t kUser = 0600;
+  constexpr std::uint32_t kGroup = 0660;
+  constexpr std::uint32_t kEverybody = 0666;
+  if (!listener.group.empty()) return kGroup;
+  const auto login = environmentPath("XDG_RUNTIME_DIR");
+  return login.has_value() && isBelow(listener.socket, *login) ? kUser : kEverybody;
+}
+
+void readMode(TableReader& table, Configuration::Listener& listener) {
+  constexpr int kOctal = 8;
+  std::string mode;
+  table.readText("mode", isMode, "permissions such as \"0660\", from \"0600\" to \"0777\"", mode);
+  listener.mode = mode.empty() ? defaultMode(listener)
+                               : static_cast<std::uint32_t>(std::stoul(mode, nullptr, kOctal));
+}
+
 void readListener(TableReader table, Configuration::Listener& listener) {
   table.read("socket", listener.socket, kLongestSocketPath);
+  table.readText("group", isNotEmpty, "the name of a group", listener.group);
+  readMode(table, listener);
   auto bus = static_cast<std::size_t>(listener.bus);
   table.readChoice("bus", {"none", "session", "system"}, bus);
   listener.bus = static_cast<BusKind>(bus);
@@ -267,6 +297,7 @@ DefaultPlaces placesOfService() { return {defaultSocketPath(), defaultStorageDir
 Configuration defaultConfiguration(const DefaultPlaces& places) {
   Configuration configuration;
   configuration.listener.socket = places.socket;
+  configuration.listener.mode = defaultMode(configuration.listener);
   configuration.storage.directory = places.storageDirectory;
   configuration.storage.root = configuration.storage.directory / "root";
   setDefaultDirectories(configuration);

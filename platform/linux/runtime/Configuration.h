@@ -27,6 +27,8 @@ using FeatureSwitches =
 struct Configuration {
   struct Listener {
     std::filesystem::path socket;
+    std::uint32_t mode = 0;  // permission bits of the socket's file
+    std::string group;       // whom the file is given to; empty: as it is made
     BusKind bus = BusKind::kNone;
     std::chrono::milliseconds handshakeTimeout{30'000};  // handshake_seconds
     std::chrono::milliseconds messageTimeout{60'000};  // message_seconds: a message begun must end

@@ -27,6 +27,11 @@ std::filesystem::path homeDirectory() {
   return "/";
 }
 
+bool isBelow(const std::filesystem::path& path, const std::filesystem::path& directory) {
+  const std::filesystem::path relative = path.lexically_relative(directory);
+  return !relative.empty() && *relative.begin() != ".." && relative != ".";
+}
+
 std::optional<std::filesystem::path> expandedPath(std::string_view text) {
   if (text.find('\0') != std::string_view::npos) return std::nullopt;
   if (text == "~") return homeDirectory();

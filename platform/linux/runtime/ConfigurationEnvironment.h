@@ -19,6 +19,9 @@ std::filesystem::path homeDirectory();
 // holds a NUL.
 std::optional<std::filesystem::path> expandedPath(std::string_view text);
 
+// Whether `path` names something within `directory`, by their names alone.
+bool isBelow(const std::filesystem::path& path, const std::filesystem::path& directory);
+
 // Where a service listens and stores of whom nothing else was said.
 std::filesystem::path defaultSocketPath();
 std::filesystem::path defaultStorageDirectory();

@@ -29,6 +29,14 @@ INSTANTIATE_TEST_SUITE_P(
     ::testing::Values(
         MistakeCase{"WrongType", "[listener]\nsocket = 3",
                     "2:10: listener.socket: expected an absolute path, found 3"},
+        MistakeCase{"NoMode", "[listener]\nmode = \"rw\"",
+                    "2:8: listener.mode: expected permissions such as \"0660\", from \"0600\" to "
+                    "\"0777\", found the string \"rw\""},
+        MistakeCase{"ModeWithoutTheOwner", "[listener]\nmode = \"0466\"",
+                    "2:8: listener.mode: expected permissions such as \"0660\", from \"0600\" to "
+                    "\"0777\", found the string \"0466\""},
+        MistakeCase{"NoGroup", "[listener]\ngroup = \"\"",
+                    "2:9: listener.group: expected the name of a group, found the string \"\""},
         MistakeCase{"RelativePath", "[storage]\ndirectory = \"state\"",
                     "2:13: storage.directory: expected an absolute path, found the string "
                     "\"state\""},

@@ -104,6 +104,8 @@ TEST_F(ConfigurationTest, EveryKeyIsTaken) {
   const Configuration configuration = loaded(R"(
 [listener]
 socket = "/tmp/r.sock"
+mode = "0640"
+group = "audio"
 bus = "system"
 handshake_seconds = 2.5
 message_seconds = 9
@@ -127,6 +129,8 @@ keep_snapshots = 3
 )");
 
   EXPECT_EQ(configuration.listener.socket, "/tmp/r.sock");
+  EXPECT_EQ(configuration.listener.mode, 0640U);
+  EXPECT_EQ(configuration.listener.group, "audio");
   EXPECT_EQ(configuration.listener.bus, BusKind::kSystem);
   EXPECT_EQ(configuration.listener.handshakeTimeout, std::chrono::milliseconds(2500));
   EXPECT_EQ(configuration.listener.messageTimeout, std::chrono::seconds(9));
@@ -141,6 +145,28 @@ keep_snapshots = 3
   EXPECT_EQ(configuration.logLevel, LogLevel::kDebug);
   EXPECT_EQ(configuration.logMemoryLevel, LogLevel::kError);
   EXPECT_EQ(configuration.keepSnapshots, 3U);
+}
+
+TEST_F(ConfigurationTest, EveryUserMayConnectToAServiceOfTheSystem) {
+  EXPECT_EQ(loaded("").listener.mode, 0666U);
+  ::setenv("XDG_RUNTIME_DIR", "/run/user/0", 1);
+  EXPECT_EQ(loaded("[listener]\nsocket = \"/run/halvox/r.sock\"\n").listener.mode, 0666U);
+  EXPECT_EQ(loaded("[listener]\nsocket = \"/run/user/01/r.sock\"\n").listener.mode, 0666U);
+}
+
+TEST_F(ConfigurationTest, OnlyTheUserMayConnectToASocketOfALogin) {
+  ::setenv("XDG_RUNTIME_DIR", "/run/user/1000", 1);
+
+  EXPECT_EQ(loaded("").listener.mode, 0600U);
+  EXPECT_EQ(defaultConfiguration().listener.mode, 0600U);
+  ::setenv("RUNTIME_DIRECTORY", "/run/user/1000/halvox",
+           1);  // as the user's service manager has it
+  EXPECT_EQ(loaded("").listener.mode, 0600U);
+}
+
+TEST_F(ConfigurationTest, AGroupThatIsGivenKeepsOthersOutUnlessTheModeSaysOtherwise) {
+  EXPECT_EQ(loaded("[listener]\ngroup = \"audio\"\n").listener.mode, 0660U);
+  EXPECT_EQ(loaded("[listener]\ngroup = \"audio\"\nmode = \"0664\"\n").listener.mode, 0664U);
 }
 
 TEST_F(ConfigurationTest, RootFollowsTheDirectory) {

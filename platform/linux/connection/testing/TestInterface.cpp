@@ -94,6 +94,7 @@ constexpr std::array kMethods = {
     InterfaceMethod{"name", "ax", "b", kNoMore, answerTrue, countNumbers},
     InterfaceMethod{"list", "", "ax", kNoMore, list},
     InterfaceMethod{"pid", "", "u", kNoMore, pid},
+    InterfaceMethod{"end", "", "b", kNoMore, answerTrue, nullptr, MethodAccess::kOwner},
 };
 constexpr NSXPCInterface kInterface{
     .name = kTestInterface, .objectPath = kTestPath, .methods = kMethods};

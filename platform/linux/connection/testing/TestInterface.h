@@ -50,6 +50,7 @@ class TestObject final : public ExportedObject {
 //   grow → b          true; may hold more
 //   name ax → b       true; the numbers are reporter IDs
 //   list → ax         1000 numbers
+//   end → b           true; for the owner only
 //   pid → u           the process that asks; 0 when no connection or request is current
 const NSXPCInterface& testInterface();
 inline constexpr const char* kTestPath = "/com/tarno/test/object";
