@@ -3,6 +3,8 @@
 #include <cstdlib>
 #include <exception>
 #include <memory>
+#include <span>
+#include <string>
 #include <variant>
 
 #include <sysexits.h>
@@ -10,8 +12,10 @@
 #include "platform/connection.h"
 #include "platform/linux/LinuxPlatform.h"
 #include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/runtime/Version.h"
 #include "platform/services.h"
 #include "service/HVReportingServiceDelegate.h"
+#include "service/ServiceArguments.h"
 
 namespace {
 
@@ -40,18 +44,34 @@ int serve(const Configuration& configuration) {
   return EXIT_SUCCESS;
 }
 
-int run(int argumentCount, char** arguments) {
-  if (argumentCount > 1) {
-    return refuse(EX_USAGE, std::string("unexpected argument '") + arguments[1] +
-                                "': all settings are in the configuration file, " +
-                                platform::linux_::configurationPath().string());
-  }
+int print(const std::string& text) {
+  const bool isWritten = std::fputs(text.c_str(), stdout) >= 0 && std::fflush(stdout) == 0;
+  return isWritten ? EXIT_SUCCESS : refuse(EX_IOERR, "the output cannot be written");
+}
+
+int configureAndServe() {
   const auto loaded = platform::linux_::loadConfiguration();
   if (const auto* error = std::get_if<ConfigurationError>(&loaded)) {
     const bool wrong = error->kind == ConfigurationError::Kind::kWrong;
     return refuse(wrong ? EX_CONFIG : EX_NOINPUT, error->description);
   }
   return serve(std::get<Configuration>(loaded));
+}
+
+int run(std::span<const char* const> arguments) {
+  using Request = ServiceArguments::Request;
+  const ServiceArguments parsed = parseServiceArguments(arguments);
+  switch (parsed.request) {
+    case Request::kServe:
+      return configureAndServe();
+    case Request::kShowHelp:
+      return print(serviceHelp(platform::linux_::configurationPath().string()));
+    case Request::kShowVersion:
+      return print(std::string("halvox-reportingd ") + platform::linux_::halvoxVersion() + "\n");
+    case Request::kMistake:
+      return refuse(EX_USAGE, parsed.mistake);
+  }
+  return EX_SOFTWARE;
 }
 
 }  // namespace
@@ -61,7 +81,7 @@ int main(int argc, char** argv) {
   std::signal(SIGPIPE, SIG_IGN);
   std::signal(SIGXFSZ, SIG_IGN);
   try {
-    return run(argc, argv);
+    return run(std::span<const char* const>(argv, static_cast<std::size_t>(argc)).subspan(1));
   } catch (const std::exception& error) {
     return refuse(EX_SOFTWARE, error.what());
   }

@@ -7,8 +7,8 @@
 
 #include <CLI/CLI.hpp>
 
+#include "platform/linux/runtime/Version.h"
 #include "tools/CommandSet.h"
-#include "tools/HalvoxVersion.h"
 #include "tools/JsonText.h"
 #include "tools/commands/Commands.h"
 
@@ -193,7 +193,7 @@ std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string>
         "'COMMAND --help' explains a command; 'quit' or the end of the input ends the shell.");
   } else {
     app.name("halvoxctl");
-    app.set_version_flag("--version", std::string("halvoxctl ") + kHalvoxVersion,
+    app.set_version_flag("--version", std::string("halvoxctl ") + platform::linux_::halvoxVersion(),
                          "Print the version");
     app.footer(kExitStatusNote);
   }

@@ -77,6 +77,25 @@ class Startup(unittest.TestCase):
 
         self.assert_refused(result, EX_NOINPUT, "halvox.toml")
 
+    def test_help_and_version_answer_without_starting_anything(self):
+        version = subprocess.run([harness.CTL, "--version"], capture_output=True, text=True, check=True)
+
+        for arguments, shown in ((["--help"], "Usage: halvox-reportingd"), (["-h"], "--version"),
+                                 (["--help"], "halvox.toml"),
+                                 (["--version"], version.stdout.replace("halvoxctl", "halvox-reportingd"))):
+            with self.subTest(arguments=arguments):
+                result = self.run_service(None, arguments)
+
+                self.assertEqual((result.returncode, result.stderr), (0, ""))
+                self.assertIn(shown, result.stdout)
+        self.assertEqual(list(self.directory.iterdir()), [])
+
+    def test_unknown_argument_is_named_before_the_configuration_is_looked_at(self):
+        result = self.run_service("this is wrong", ["--bogus"])
+
+        self.assert_refused(result, EX_USAGE, "--bogus")
+        self.assertEqual((result.stdout, result.stderr.count("\n")), ("", 1))
+
     def test_arguments_are_refused(self):
         result = self.run_service(self.config(), ["--verbose"])
 
