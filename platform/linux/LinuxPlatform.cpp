@@ -6,6 +6,7 @@
 #include <sysexits.h>
 
 #include "platform/linux/drivers/ConfiguredSources.h"
+#include "platform/linux/runtime/ConfigurationEnvironment.h"
 #include "platform/log.h"
 
 namespace halvox::platform::linux_ {
@@ -27,7 +28,9 @@ ConnectionOptions connectionOptions(const Configuration& configuration) {
   ConnectionOptions options;
   options.socket = configuration.listener.socket;
   options.socketAccess = {configuration.listener.mode, configuration.listener.group};
+  options.makeSocketDirectory = configuration.listener.socket == defaultSocketPath();
   options.bus = configuration.listener.bus;
+  options.starter = starterBus();
   options.handshakeTimeout = configuration.listener.handshakeTimeout;
   options.messageTimeout = configuration.listener.messageTimeout;
   options.clientHistoryMegabytes = configuration.limits.clientHistoryMegabytes;

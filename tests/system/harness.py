@@ -130,7 +130,8 @@ class Service:
             + config
         )
         self._environment = {
-            **os.environ,
+            # The terminal that the tests are run from may have been started by a bus.
+            **{key: value for key, value in os.environ.items() if not key.startswith("DBUS_STARTER_")},
             "HALVOX_CONFIG": str(self.config),
             "XDG_RUNTIME_DIR": str(self.directory),
             "XDG_STATE_HOME": str(self.directory / "xdg-state"),

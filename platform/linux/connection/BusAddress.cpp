@@ -83,4 +83,14 @@ std::string busAddressOf(BusKind bus) {
   return "";
 }
 
+std::optional<StarterBus> starterBus() {
+  const std::string type = environment("DBUS_STARTER_BUS_TYPE");
+  StarterBus bus{.kind = BusKind::kNone, .address = environment("DBUS_STARTER_ADDRESS")};
+  if (type == "session") bus.kind = BusKind::kSession;
+  if (type == "system") bus.kind = BusKind::kSystem;
+  if (bus.address.empty()) bus.address = busAddressOf(bus.kind);
+  if (bus.address.empty()) return std::nullopt;
+  return bus;
+}
+
 }  // namespace halvox::platform::linux_

@@ -24,4 +24,15 @@ std::vector<BusSocket> parseBusAddress(std::string_view addresses);
 // The address of a bus, from the environment or the usual place.
 std::string busAddressOf(BusKind bus);
 
+// The bus that started a process.
+struct StarterBus {
+  BusKind kind = BusKind::kNone;  // kNone: neither of the usual ones
+  std::string address;
+  friend bool operator==(const StarterBus&, const StarterBus&) = default;
+};
+
+// The bus that started this process, which it says in the environment; none when none did. A unit
+// that starts the service in the place of a bus may name the kind alone.
+std::optional<StarterBus> starterBus();
+
 }  // namespace halvox::platform::linux_

@@ -1,5 +1,7 @@
 #include "platform/linux/connection/BusAddress.h"
 
+#include <cstdlib>
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -33,6 +35,43 @@ TEST(BusAddressTest, NonsenseIsLeftOut) {
   EXPECT_THAT(parseBusAddress("unix:"), IsEmpty());
   EXPECT_THAT(parseBusAddress(";;,=%"), IsEmpty());
   EXPECT_THAT(parseBusAddress(""), IsEmpty());
+}
+
+class StarterBusTest : public testing::Test {
+ protected:
+  // The one that an environment with these three variables names; null: the variable is not set.
+  static std::optional<StarterBus> starterOf(const char* type, const char* address,
+                                             const char* systemBus = nullptr) {
+    set("DBUS_STARTER_BUS_TYPE", type);
+    set("DBUS_STARTER_ADDRESS", address);
+    set("DBUS_SYSTEM_BUS_ADDRESS", systemBus);
+    return starterBus();
+  }
+  void TearDown() override { starterOf(nullptr, nullptr); }
+
+ private:
+  static void set(const char* name, const char* value) {
+    value == nullptr ? unsetenv(name) : setenv(name, value, 1);
+  }
+};
+
+TEST_F(StarterBusTest, IsTheOneThatTheEnvironmentNames) {
+  EXPECT_EQ(starterOf("session", "unix:path=/a"), (StarterBus{BusKind::kSession, "unix:path=/a"}));
+  EXPECT_EQ(starterOf("system", "unix:path=/a"), (StarterBus{BusKind::kSystem, "unix:path=/a"}));
+  EXPECT_EQ(starterOf("other", "unix:path=/a"), (StarterBus{BusKind::kNone, "unix:path=/a"}));
+  EXPECT_EQ(starterOf(nullptr, "unix:path=/a"), (StarterBus{BusKind::kNone, "unix:path=/a"}));
+}
+
+TEST_F(StarterBusTest, IsAtItsUsualAddressWhenTheKindAloneIsNamed) {
+  EXPECT_EQ(starterOf("system", nullptr, "unix:path=/b"),
+            (StarterBus{BusKind::kSystem, "unix:path=/b"}));
+  EXPECT_EQ(starterOf("system", ""),
+            (StarterBus{BusKind::kSystem, "unix:path=/run/dbus/system_bus_socket"}));
+}
+
+TEST_F(StarterBusTest, IsNoneWhereNothingIsNamed) {
+  EXPECT_EQ(starterOf(nullptr, nullptr), std::nullopt);
+  EXPECT_EQ(starterOf("other", ""), std::nullopt);
 }
 
 }  // namespace

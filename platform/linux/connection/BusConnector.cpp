@@ -51,9 +51,9 @@ std::variant<UniqueFd, int> connectTo(const BusSocket& bus) {
 BusConnector::BusConnector(std::string busName)
     : busName_(std::move(busName)), input_(dbus::kMaxMessageBytes) {}
 
-std::variant<BusSession, ConnectionOpenError> BusConnector::connect(BusKind bus) {
+std::variant<BusSession, ConnectionOpenError> BusConnector::connect(const std::string& address) {
   deadline_ = std::chrono::steady_clock::now() + kBusTimeout;
-  if (Failure failure = connectToFirst(busAddressOf(bus))) return *std::move(failure);
+  if (Failure failure = connectToFirst(address)) return *std::move(failure);
   if (Failure failure = authenticate()) return *std::move(failure);
   const auto ignore = [](const Value&) -> Failure { return std::nullopt; };
   if (Failure failure = call("Hello", "", {}, "s", ignore)) return *std::move(failure);

@@ -27,15 +27,15 @@ struct BusSession {
   std::uint32_t lastSerial = 0;
 };
 
-// Connects to a bus, once: handshake, Hello, the name, and a match for names that vanish.
-// Waits for the bus, but no longer than kBusTimeout in all.
+// Connects to the bus of an address, once: handshake, Hello, the name, and a match for names that
+// vanish. Waits for the bus, but no longer than kBusTimeout in all.
 class BusConnector {
  public:
   explicit BusConnector(std::string busName);
   BusConnector(const BusConnector&) = delete;
   BusConnector& operator=(const BusConnector&) = delete;
 
-  std::variant<BusSession, ConnectionOpenError> connect(BusKind bus);
+  std::variant<BusSession, ConnectionOpenError> connect(const std::string& address);
 
  private:
   using Failure = std::optional<ConnectionOpenError>;

@@ -73,7 +73,7 @@ std::optional<ConnectionOpenError> ConnectionHost::open() {
   allowMoreDescriptors();
   if (auto error = openLoop()) return error;
   if (auto error = openSockets()) return error;
-  return openBus();
+  return openBuses();
 }
 
 std::optional<ConnectionOpenError> ConnectionHost::openLoop() {
@@ -91,6 +91,7 @@ std::optional<ConnectionOpenError> ConnectionHost::openSockets() {
   if (auto* error = std::get_if<ConnectionOpenError>(&passed)) return std::move(*error);
   auto& sockets = std::get<std::vector<UniqueFd>>(passed);
   if (sockets.empty()) {
+    if (options_.makeSocketDirectory) makeDirectoryOf(options_.socket, options_.socketAccess);
     auto bound = listenOn(options_.socket, options_.socketAccess);
     if (auto* error = std::get_if<ConnectionOpenError>(&bound)) return std::move(*error);
     socketFile_ = std::move(std::get<BoundSocket>(bound).file);
@@ -103,11 +104,29 @@ std::optional<ConnectionOpenError> ConnectionHost::openSockets() {
   return std::nullopt;
 }
 
-std::optional<ConnectionOpenError> ConnectionHost::openBus() {
-  if (options_.bus == BusKind::kNone) return std::nullopt;
-  auto connected = BusConnector(options_.busName).connect(options_.bus);
+std::optional<ConnectionOpenError> ConnectionHost::openBuses() {
+  const std::optional<StarterBus>& starter = options_.starter;
+  const bool wantsBus = options_.bus != BusKind::kNone;
+  const bool isStartersBus = wantsBus && starter.has_value() && starter->kind == options_.bus;
+  if (wantsBus) {
+    auto error = joinBus(isStartersBus ? starter->address : busAddressOf(options_.bus));
+    if (error) return error;
+  }
+  if (!starter.has_value() || isStartersBus) return std::nullopt;
+  if (const auto error = joinBus(starter->address)) {
+    kLog.error("cannot join the bus that started the service: ", error->description,
+               "; clients reach it through its socket", wantsBus ? " and listener.bus" : "");
+  } else {
+    kLog.notice("serving the bus that started the service, ", starter->address);
+  }
+  return std::nullopt;
+}
+
+std::optional<ConnectionOpenError> ConnectionHost::joinBus(const std::string& address) {
+  auto connected = BusConnector(options_.busName).connect(address);
   if (auto* error = std::get_if<ConnectionOpenError>(&connected)) return std::move(*error);
-  bus_ = std::make_unique<BusConnection>(*this, std::move(std::get<BusSession>(connected)));
+  buses_.push_back(
+      std::make_unique<BusConnection>(*this, std::move(std::get<BusSession>(connected))));
   return std::nullopt;
 }
 
@@ -117,8 +136,8 @@ void ConnectionHost::resume() {
     return;
   }
   inbox_->attachToThisThread();
-  if (bus_) bus_->start();
-  kLog.info("serving ", listeners_.size(), " sockets", bus_ ? " and a bus" : "");
+  for (const auto& bus : buses_) bus->start();
+  kLog.info("serving ", listeners_.size(), " sockets and ", buses_.size(), " buses");
   static_cast<void>(sd_notify(0, "READY=1"));
   while (!stopping_) takeTurn();
   static_cast<void>(sd_notify(0, "STOPPING=1"));
@@ -202,7 +221,7 @@ void ConnectionHost::shutDown() {
   turn_.clear();
   const auto peers = std::exchange(peers_, {});
   for (const auto& [key, peer] : peers) peer->abandon();
-  if (bus_) bus_->abandon();
+  for (const auto& bus : buses_) bus->abandon();
   listeners_.clear();
   socketFile_.remove();
 }

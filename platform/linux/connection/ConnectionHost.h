@@ -71,7 +71,8 @@ class ConnectionHost final : public NSXPCListener {
  private:
   [[nodiscard]] std::optional<ConnectionOpenError> openLoop();
   [[nodiscard]] std::optional<ConnectionOpenError> openSockets();
-  [[nodiscard]] std::optional<ConnectionOpenError> openBus();
+  [[nodiscard]] std::optional<ConnectionOpenError> openBuses();
+  [[nodiscard]] std::optional<ConnectionOpenError> joinBus(const std::string& address);
   void takeTurn();
   void expireDeadlines();
   [[nodiscard]] std::optional<DeadlineQueue::Clock::time_point> firstDeadline() const;
@@ -99,7 +100,7 @@ class ConnectionHost final : public NSXPCListener {
   SocketFile socketFile_;
   std::vector<std::unique_ptr<ListeningSocket>> listeners_;
   std::unordered_map<const PeerConnection*, std::shared_ptr<PeerConnection>> peers_;
-  std::unique_ptr<BusConnection> bus_;
+  std::vector<std::unique_ptr<BusConnection>> buses_;
   std::uint64_t lastClientNumber_ = 0;
   bool stopping_ = false;
 };

@@ -10,6 +10,7 @@
 #include <string>
 
 #include "platform/connection.h"
+#include "platform/linux/connection/BusAddress.h"
 #include "platform/linux/connection/ConnectionLimits.h"
 #include "platform/linux/runtime/Backpressure.h"
 #include "platform/linux/runtime/Configuration.h"
@@ -33,7 +34,12 @@ struct ConnectionOptions {
   // These two are not used when the service is started through a socket.
   std::filesystem::path socket;
   SocketAccess socketAccess;
-  BusKind bus = BusKind::kNone;
+  // Makes the directory of the socket, if it alone is missing.
+  bool makeSocketDirectory = false;
+  BusKind bus = BusKind::kNone;  // nothing is served when it cannot be joined
+  // Joined too, unless it is `bus`. When that fails, the rest is served all the same: whatever a
+  // bus starts has this in its environment, and so have the programs that are started from there.
+  std::optional<StarterBus> starter;
   std::string busName = "com.tarno.halvox.reporting";
   std::chrono::milliseconds handshakeTimeout{30'000};
   std::chrono::milliseconds messageTimeout{60'000};
@@ -71,7 +77,8 @@ struct ConnectionOpenError {
   std::string description;  // one line for the user, naming the object and the system's error
 };
 
-// Connections over D-Bus: peer to peer on a Unix socket of its own, and on a bus when asked to.
+// Connections over D-Bus: peer to peer on a Unix socket of its own, on a bus when asked to, and on
+// the bus that started the process.
 //
 // One thread, the one that calls resume() of the listener, carries out all input and output, runs
 // the delegate, the handlers and the requests. It never waits for a client: what a client does not
@@ -89,8 +96,8 @@ class LinuxConnectionService final : public ConnectionService {
   LinuxConnectionService& operator=(const LinuxConnectionService&) = delete;
   ~LinuxConnectionService() override;
 
-  // Makes the socket, or takes the ones passed at start, and connects to the bus. A socket file
-  // that nobody serves any more is replaced. May wait for the bus, a few seconds at most. Lets
+  // Makes the socket, or takes the ones passed at start, and connects to the buses. A socket file
+  // that nobody serves any more is replaced. May wait for each bus, a few seconds at most. Lets
   // the process have as many descriptors as it may.
   [[nodiscard]] std::optional<ConnectionOpenError> open();
 

@@ -185,6 +185,13 @@ std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::p
   return bound;
 }
 
+void makeDirectoryOf(const std::filesystem::path& path, const SocketAccess& access) {
+  constexpr std::uint32_t kOthers = 0077;
+  const std::string directory = path.parent_path().native();
+  if (mkdir(directory.c_str(), 0700) != 0) return;
+  if ((access.mode & kOthers) != 0) static_cast<void>(chmod(directory.c_str(), 0755));
+}
+
 std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
   std::vector<UniqueFd> sockets;
   const int count = sd_listen_fds(1);

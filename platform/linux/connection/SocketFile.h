@@ -43,6 +43,10 @@ struct BoundSocket {
 std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
                                                         const SocketAccess& access = {});
 
+// Makes the directory that `path` is in, unless it is there: open to the same users as the socket
+// is. A failure is left to listenOn() to report.
+void makeDirectoryOf(const std::filesystem::path& path, const SocketAccess& access);
+
 // The sockets that the service was started through; none when it was started otherwise. Later
 // calls give none, and child processes do not inherit them.
 std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets();

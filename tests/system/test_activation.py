@@ -1,0 +1,144 @@
+"""A service that D-Bus starts is found on the bus that started it, as the packaged files have it."""
+
+import contextlib
+import os
+import re
+import shutil
+import signal
+import subprocess
+import tempfile
+import unittest
+from pathlib import Path
+
+from gi.repository import Gio, GLib
+
+import harness
+from harness import BUS_NAME, SERVICE, WITH_US, Client, Service, iterate_until, private_bus, wait_for
+
+PACKAGING = Path(__file__).parents[2] / "packaging"
+SERVICE_FILE = PACKAGING / "dbus" / f"{BUS_NAME}.service"
+BUS = "org.freedesktop.DBus"
+
+
+def shipped_unit():
+    """What the D-Bus service file has systemd start."""
+    name = re.search(r"^SystemdService=(.+)$", SERVICE_FILE.read_text(), re.MULTILINE)[1]
+    return name, (PACKAGING / "systemd" / name).read_text()
+
+
+class Activation(unittest.TestCase):
+    @classmethod
+    def setUpClass(cls):
+        harness.require("dbus-daemon")
+
+    def setUp(self):
+        self.directory = Path(tempfile.mkdtemp(prefix="halvox-test-"))
+        self.addCleanup(shutil.rmtree, self.directory, True)
+        (self.directory / "run").mkdir(mode=0o700)
+
+    def environment(self):
+        """That of a login in which nothing is configured; both buses are the test's own."""
+        return {"HOME": str(self.directory), "XDG_RUNTIME_DIR": str(self.directory / "run"),
+                "XDG_CONFIG_HOME": str(self.directory / "config"), "HALVOX_CONFIG": "",
+                "XDG_STATE_HOME": str(self.directory / "state")}
+
+    @contextlib.contextmanager
+    def bus(self, *options):
+        """A bus that knows the service by the packaged file, with the path of the built program."""
+        services = self.directory / "services"
+        services.mkdir()
+        text = SERVICE_FILE.read_text()
+        self.assertIn("Exec=/usr/bin/halvox-reportingd\n", text)
+        # Its parent is a process of the bus that does not outlive the start, so it cannot be told to
+        # end with it. If the test is killed, the service ends by itself all the same.
+        command = f"{shutil.which('timeout')} 120 {SERVICE}"
+        (services / SERVICE_FILE.name).write_text(text.replace("/usr/bin/halvox-reportingd", command))
+        configuration = (f"<servicedir>{services}</servicedir>"
+                         f"<limit name='service_start_timeout'>{10000}</limit>")
+        with private_bus(configuration, options, self.environment()) as address:
+            yield address
+
+    def connect(self, address):
+        client = Client.to_bus(address)
+        self.addCleanup(client.close)
+        return client
+
+    def call_bus(self, client, member, signature, *arguments):
+        return client.connection.call_sync(
+            BUS, "/org/freedesktop/DBus", BUS, member, GLib.Variant(f"({signature})", arguments), None,
+            Gio.DBusCallFlags.NONE, int(harness.DEADLINE * 1000), None).unpack()
+
+    def stop_owner(self, client):
+        """Ends the service that the bus started, which is nobody's child."""
+        pid, = self.call_bus(client, "GetConnectionUnixProcessID", "s", BUS_NAME)
+        os.kill(pid, signal.SIGTERM)
+        wait_for("the end of the service", lambda: not Path(f"/proc/{pid}").exists())
+
+    def test_a_call_by_name_starts_the_service_and_is_answered(self):
+        with self.bus() as address:
+            client = self.connect(address)
+
+            answer = client.connection.call_sync(
+                BUS_NAME, harness.OBJECT, harness.INTERFACE, "createReportingSession",
+                GLib.Variant("(x)", (7,)), None, Gio.DBusCallFlags.NONE,
+                int(harness.DEADLINE * 1000), None)
+
+            self.assertEqual(answer.unpack(), (True,))
+            self.assertTrue((self.directory / "run/halvox/reporting.sock").is_socket())
+            self.stop_owner(client)
+
+    def test_a_bus_that_leaves_starting_to_systemd_is_joined_too(self):
+        """The test stands for systemd: it starts the unit's command in the unit's environment."""
+        unit_name, unit = shipped_unit()
+        with self.bus("--systemd-activation") as address:
+            systemd = self.connect(address)
+            asked = []
+            systemd.connection.signal_subscribe(
+                BUS, "org.freedesktop.systemd1.Activator", "ActivationRequest", None, None,
+                Gio.DBusSignalFlags.NONE, lambda *signal_: asked.append(signal_[5].unpack()[0]))
+            self.assertEqual(self.call_bus(systemd, "RequestName", "su", "org.freedesktop.systemd1", 4), (1,))
+            client = self.connect(address)
+            call = harness.Pending()
+            client.connection.call(
+                BUS_NAME, harness.OBJECT, harness.INTERFACE, "getAllReporters", None, None,
+                Gio.DBusCallFlags.NONE, int(harness.DEADLINE * 1000), None, call.finish)
+            iterate_until("the request to systemd", lambda: asked)
+            self.assertEqual(asked, [unit_name])
+            variables = dict(line.split("=", 1) for line in re.findall(r"^Environment=(.+)$", unit, re.MULTILINE))
+            self.assertIn("ExecStart=/usr/bin/halvox-reportingd\n", unit)
+            service = subprocess.Popen(
+                [*WITH_US, str(SERVICE)], stderr=subprocess.DEVNULL,
+                env={**os.environ, **self.environment(), **variables, "DBUS_SYSTEM_BUS_ADDRESS": address})
+            self.addCleanup(harness.stop_process, service)
+
+            self.assertEqual(call.wait(), [])
+
+    def test_a_program_started_by_another_bus_serves_its_socket_all_the_same(self):
+        """As from a terminal that a bus has started: the bus is gone, or the name is taken."""
+        environment = {"DBUS_STARTER_ADDRESS": f"unix:path={self.directory}/no-bus",
+                       "DBUS_STARTER_BUS_TYPE": "session"}
+        with Service(environment=environment) as service:
+            client = service.client()
+            self.assertIs(client.create(7), True)
+            client.close()
+            self.assertIn("cannot join the bus that started the service", service.log())
+
+    def test_the_bus_of_the_configuration_is_joined_beside_the_one_that_started_it(self):
+        with private_bus() as configured, private_bus() as starter:
+            environment = {"DBUS_SESSION_BUS_ADDRESS": configured, "DBUS_STARTER_ADDRESS": starter,
+                           "DBUS_STARTER_BUS_TYPE": "system"}
+            with Service(bus="session", environment=environment):
+                for address in (configured, starter):
+                    self.assertIs(self.connect(address).create(7), True)
+
+    def test_one_bus_is_joined_once(self):
+        with private_bus() as address:
+            environment = {"DBUS_SESSION_BUS_ADDRESS": address, "DBUS_STARTER_ADDRESS": address,
+                           "DBUS_STARTER_BUS_TYPE": "session"}
+            with Service(bus="session", environment=environment) as service:
+                self.assertIs(self.connect(address).create(7), True)
+                self.assertNotIn("cannot join", service.log())
+
+
+if __name__ == "__main__":
+    unittest.main()
