@@ -100,7 +100,7 @@ TEST_F(HVReportingDriverUtilityTest, SamplingIsLoggedAtInfoLevel) {
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
   const auto utility = makeUtility();
 
-  utility.getSnapShot();
+  static_cast<void>(utility.getSnapShot());
   utility.sendDriverLogsForSession(session_);
 
   EXPECT_EQ(lines(LogLevel::kInfo),
