@@ -84,6 +84,8 @@ TEST(SummaryFileNameTest, ANameThatJustFitsIsNotCut) {
   EXPECT_EQ(appPart(std::string(room, 'x')), std::string(room, 'x'));
   EXPECT_EQ(appPart(std::string(room - 1, 'x')), std::string(room - 1, 'x'));
   EXPECT_EQ(appPart(std::string(room + 1, 'x')), std::string(room, 'x'));
+  const std::string whole = "first" + std::string(room - 9, 'x') + "last";
+  EXPECT_EQ(appPart(whole + "y"), whole);
 }
 
 TEST(SummaryFileNameTest, ALongNameWithoutTheBeginningOfACharacterIsCutToNothing) {

@@ -169,8 +169,8 @@ class ChoiceTest(unittest.TestCase):
         self.assertEqual([file for file in files if "Test" in file], [])
 
 
-@unittest.skipIf(any(shutil.which(tool) is None for tool in ("cmake", "ninja", "git", "ld.lld")),
-                 "needs cmake, ninja, git and lld")
+@unittest.skipIf(any(shutil.which(tool) is None for tool in ("cmake", "ninja", "git", "ld.lld", "prlimit")),
+                 "needs cmake, ninja, git, lld and prlimit")
 class PlantedTest(unittest.TestCase):
     @classmethod
     def setUpClass(cls):
@@ -182,7 +182,7 @@ class PlantedTest(unittest.TestCase):
             (cls.root / name).write_text(text)
         subprocess.run(["git", "init", "-q", str(cls.root)], check=True)
         shortest = build.SHORTEST_LIMIT
-        build.SHORTEST_LIMIT = 3.0
+        build.SHORTEST_LIMIT = 2.0
         cls.addClassCleanup(setattr, build, "SHORTEST_LIMIT", shortest)
         cls.tree = build.Tree(cls.root, directory / "scratch", ["session", "service"], 2)
         cls.tree.prepare()
