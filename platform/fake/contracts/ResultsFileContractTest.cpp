@@ -22,13 +22,13 @@ class FakeResultsFileHarness {
     const auto file = service_.finished(path);
     if (!file.has_value()) return std::nullopt;
     ResultsFileContent content{file->productName, file->version, {}};
-    for (const auto& [name, unit, value] : file->measurements) {
-      auto place = std::ranges::find_if(content.values,
-                                        [&](const auto& entry) { return entry.first == name; });
+    for (const auto& measurement : file->measurements) {
+      auto place = std::ranges::find_if(
+          content.values, [&](const auto& entry) { return entry.first == measurement.name; });
       if (place == content.values.end()) {
-        place = content.values.insert(place, {name, std::vector<double>()});
+        place = content.values.insert(place, {measurement.name, std::vector<double>()});
       }
-      place->second.push_back(value);
+      place->second.push_back(measurement.value);
     }
     return content;
   }
