@@ -29,9 +29,13 @@ std::string_view failureKind(ExitStatus status) {
   return "unknown";
 }
 
+void Complaint::warn(std::string_view what) const {
+  errors_ << "halvoxctl " << command_ << ": " << harmlessText(what) << '\n';
+}
+
 ExitStatus Complaint::operator()(ExitStatus status, std::string_view what,
                                  std::string_view kind) const {
-  errors_ << "halvoxctl " << command_ << ": " << harmlessText(what) << '\n';
+  warn(what);
   if (form_ == OutputForm::kJson) {
     const FailureText failure{kind.empty() ? failureKind(status) : kind, "", what};
     out_ << failureJson(command_, failure) << '\n';

@@ -34,6 +34,9 @@ class Complaint {
 
   // `kind` is the failure's in JSON; empty: the one that belongs to the status.
   ExitStatus operator()(ExitStatus status, std::string_view what, std::string_view kind = {}) const;
+  // Says what is wrong though the command goes on: a line on `errors`, and nothing on `out`, where
+  // an object would mean that the command failed.
+  void warn(std::string_view what) const;
 
  private:
   std::string command_;

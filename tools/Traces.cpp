@@ -268,10 +268,12 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
   const fs::path results = configuration.storage.root / kResultsFile;
   const std::string params = fs::absolute(request.params).string();
   const ParamsFindings found = checkParams(params);
+  const bool isUsable = found.intervals > 0;
   for (const std::string& reason : found.reasons) {
-    complain(ExitStatus::kBadArguments, params + ": " + reason);
+    const std::string text = params + ": " + reason;
+    isUsable ? complain.warn(text) : static_cast<void>(complain(ExitStatus::kBadArguments, text));
   }
-  if (found.intervals == 0) return ExitStatus::kBadArguments;
+  if (!isUsable) return ExitStatus::kBadArguments;
   const auto before = identityOf(results);
   const auto socket = namedSocket(options, complain);
   if (const auto* status = std::get_if<ExitStatus>(&socket)) return *status;

@@ -112,7 +112,7 @@ class Durability(unittest.TestCase):
         service.start()
         client = service.client()
         client.send({"number": 1}, reporters=None)
-        wait_for("the damage to be found", lambda: "was set aside as" in service.log(), 120)
+        wait_for("the new database", lambda: "to the new database" in service.log(), 120)
         client.send({"number": 2}, reporters=None)
         service.wait_for_payload(lambda payload: payload.get("number") == 2)
 

@@ -117,8 +117,15 @@ std::optional<ConnectionOpenError> giveToGroup(const std::filesystem::path& path
                      systemError(errno) + "; only root and members of a group may");
 }
 
-// Nobody can connect to a socket before it listens. So the file gets its group and its mode first,
-// and the mode after the group: the members of the old group must not get in either.
+// The file that bind() makes has the permissions of the descriptor, without those of the umask. It
+// begins with at most the owner's: a connect() that was admitted while the file was open to others
+// succeeds when the socket listens a moment later.
+bool closeToOthers(int fd, const SocketAccess& access) {
+  constexpr std::uint32_t kOwner = 0700;
+  return fchmod(fd, access.mode & kOwner) == 0;
+}
+
+// The mode comes after the group: the members of the old group must not get in either.
 std::optional<ConnectionOpenError> letIn(const std::filesystem::path& path,
                                          const SocketAccess& access) {
   if (!access.group.empty()) {
@@ -176,6 +183,9 @@ std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::p
   BoundSocket bound{.fd = newSocket(), .file = {}};
   if (!bound.fd) return failure(Kind::kSystem, path, systemError(errno));
   const auto* generic = reinterpret_cast<const sockaddr*>(&*address);
+  if (!closeToOthers(bound.fd.get(), access)) {
+    return failure(Kind::kSystem, path, "cannot set its permissions: " + systemError(errno));
+  }
   if (bind(bound.fd.get(), generic, sizeof *address) != 0) return bindFailure(path, errno);
   bound.file = SocketFile(path);
   if (auto error = letIn(path, access)) return *std::move(error);

@@ -30,10 +30,12 @@ class JsonResultsFileHarness {
     document.Parse<rapidjson::kParseFullPrecisionFlag>(text.data(), text.size());
     if (document.HasParseError()) return std::nullopt;
     ResultsFileContent content{document["product"].GetString(), document["version"].GetUint(), {}};
-    for (const auto& member : document["values"].GetObject()) {
+    // Not as a range: clang cannot compare the iterators of this library's objects.
+    const rapidjson::Value& all = document["values"];
+    for (auto member = all.MemberBegin(); !(member == all.MemberEnd()); ++member) {
       std::vector<double> values;
-      for (const auto& value : member.value.GetArray()) values.push_back(value.GetDouble());
-      content.values.emplace_back(member.name.GetString(), std::move(values));
+      for (const auto& value : member->value.GetArray()) values.push_back(value.GetDouble());
+      content.values.emplace_back(member->name.GetString(), std::move(values));
     }
     return content;
   }
