@@ -342,12 +342,19 @@ class ToolTest(unittest.TestCase):
             self.assertEqual(done.returncode, 1)
             self.assertIn("false ended with status 1", done.stderr)
 
+    def assert_only_failures(self, output):
+        """With --json each failure is an object; there is no result beside them."""
+        objects = [json.loads(line) for line in output.splitlines()]
+        self.assertGreater(len(objects), 0)
+        self.assertEqual({(each["command"], each["result"]) for each in objects},
+                         {("trace record", False)})
+
     def assert_refused(self, service, *reasons):
         """Of the parameters file, before the program runs."""
         mark = service.directory / "ran"
         done = self.record(service, "touch", mark)
         self.assertNotEqual(done.returncode, 0)
-        self.assertEqual(done.stdout, "")
+        self.assert_only_failures(done.stdout)
         for reason in (str(service.params), *reasons):
             self.assertIn(reason, done.stderr)
         self.assertFalse(mark.exists())
@@ -402,7 +409,7 @@ class ToolTest(unittest.TestCase):
             done = self.record(service, "true")
 
             self.assertNotEqual(done.returncode, 0)
-            self.assertEqual(done.stdout, "")
+            self.assert_only_failures(done.stdout)
             self.assertIn("nothing was measured", done.stderr)
 
     def test_service_that_does_not_trace_is_told(self):
