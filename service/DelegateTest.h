@@ -42,7 +42,7 @@ class TestDelegate : public HVReportingServiceDelegateProtocol {
   Clients clients;
 
  private:
-  const platform::Dictionary defaults_;
+  const platform::Dictionary defaults_{};
   std::int64_t count_ = 0;
 };
 

@@ -32,9 +32,9 @@ std::string tagOf(const StoredRecord& message) {
   rapidjson::Document document;
   document.Parse<rapidjson::kParseIterativeFlag>(payload.data(), payload.size());
   if (document.HasParseError() || !document.IsObject()) return {};
-  const auto tag = document.FindMember(kTag);
-  if (tag == document.MemberEnd() || !tag->value.IsString()) return {};
-  return {tag->value.GetString(), tag->value.GetStringLength()};
+  if (!document.HasMember(kTag) || !document[kTag].IsString()) return {};
+  const rapidjson::Value& tag = document[kTag];
+  return {tag.GetString(), tag.GetStringLength()};
 }
 
 // What stands before the category proper in the text of a category: "Session_", "_" for a domain
