@@ -1,6 +1,5 @@
 #include "backends/StringHash.h"
 
-#include <filesystem>
 #include <fstream>
 
 #include <gtest/gtest.h>
@@ -11,7 +10,7 @@ namespace halvox {
 namespace {
 
 TEST(StringHashTest, HashesEqualThoseOfLibcxx) {
-  std::ifstream file(std::filesystem::path(__FILE__).parent_path() / "testdata/string_hashes.txt");
+  std::ifstream file(HALVOX_BACKENDS_TESTDATA "/string_hashes.txt");
   ASSERT_TRUE(file.is_open());
   file >> std::hex;
 

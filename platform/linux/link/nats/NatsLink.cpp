@@ -49,7 +49,7 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
       wakeThread();
       if (isConnected_) return answers_.push_back({std::move(found), servers_});
       waiter = ++lastWaiter_;
-      waiters_.push_back({waiter, std::move(found)});
+      waiters_.push_back({waiter, std::exchange(found, nullptr)});
     }
   }
   if (!failure.empty()) kLog.error("no server of the link is looked for: ", failure);
