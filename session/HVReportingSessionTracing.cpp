@@ -80,7 +80,7 @@ void HVReportingSession::startTracing() {
 // again, by a runner of their own, so that its results are those of this run alone. Null when there
 // are none.
 std::shared_ptr<TraceRunner> HVReportingSession::runnerForThisRun() {
-  const auto current = traceRunner();
+  auto current = traceRunner();
   if (current == nullptr || current->canRun()) return current;
   auto fresh = makeRunner(traceParams().get());
   tracing_.lock()->runner = fresh;

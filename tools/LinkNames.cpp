@@ -70,7 +70,7 @@ std::string linkCategoryName(const StoredRecord& message) {
 }
 
 std::string linkTypeName(const StoredRecord& message) {
-  const std::string name(client::eventTypeName(typeOf(message)));
+  std::string name(client::eventTypeName(typeOf(message)));
   if (client::findEventType(name) == typeOf(message)) return name;
   return std::to_string(message.number(store::kLinkType));
 }
