@@ -261,6 +261,7 @@ TEST_F(HVReportingClientServerInstanceMessagesTest, ANamedSessionNeedNotBeStarte
 }
 
 TEST_F(HVReportingClientServerInstanceMessagesTest, StandaloneStepsInOrder) {
+  platform_.analytics.setBuilding(platform::FakeAnalyticsService::Building::kWhenSent);
   create(client_, 7);
   forgetSteps();
 
@@ -289,6 +290,7 @@ TEST_F(HVReportingClientServerInstanceMessagesTest, StandaloneIsANotableEvent) {
 }
 
 TEST_F(HVReportingClientServerInstanceMessagesTest, StandaloneSendsOneSingleMessageASecondLater) {
+  platform_.analytics.setBuilding(platform::FakeAnalyticsService::Building::kWhenSent);
   sendToAll(client_);
   EXPECT_THAT(platform_.dispatch.delays(), ElementsAre(std::chrono::nanoseconds(1s)));
   forgetSteps();

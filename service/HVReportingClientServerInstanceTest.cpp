@@ -182,6 +182,7 @@ TEST_F(HVReportingClientServerInstanceTest, ResourceUseFollowsSessionsAndTheirCo
 }
 
 TEST_F(HVReportingClientServerInstanceTest, AReplacedSessionGivesBackWhatItHeld) {
+  platform_.analytics.setBuilding(platform::FakeAnalyticsService::Building::kWhenSent);
   createAndStart(client_, 7);
   send(client_, {7});
 

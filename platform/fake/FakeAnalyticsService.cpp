@@ -1,5 +1,6 @@
 #include "platform/fake/FakeAnalyticsService.h"
 
+#include <thread>
 #include <utility>
 
 namespace halvox::platform {
@@ -19,7 +20,7 @@ void FakeAnalyticsService::setBuilding(Building building) {
   building_ = building;
 }
 
-void FakeAnalyticsService::buildPayloads() {
+void FakeAnalyticsService::buildPayloads() const {
   for (std::size_t index = 0;; ++index) {
     AnalyticsPayloadBuilder builder;
     {
@@ -42,6 +43,7 @@ void FakeAnalyticsService::clear() {
 }
 
 std::vector<FakeAnalyticsService::Event> FakeAnalyticsService::events() const {
+  if (buildsWhenRead()) buildPayloads();
   const std::lock_guard lock(mutex_);
   std::vector<Event> result;
   for (const Record& record : records_) result.push_back(record.event);
@@ -55,8 +57,9 @@ std::vector<FakeAnalyticsService::Event> FakeAnalyticsService::events(std::strin
 }
 
 std::vector<std::string> FakeAnalyticsService::sentNames() const {
+  const std::lock_guard lock(mutex_);
   std::vector<std::string> names;
-  for (Event& event : events()) names.push_back(std::move(event.name));
+  for (const Record& record : records_) names.push_back(record.event.name);
   return names;
 }
 
@@ -75,15 +78,18 @@ bool FakeAnalyticsService::isAnalyticsEventUsed(std::string_view eventName) {
 void FakeAnalyticsService::sendAnalyticsEventLazy(std::string eventName,
                                                   AnalyticsPayloadBuilder builder) {
   journal_.record(JournalKind::kAnalyticsEvent, eventName);
-  std::optional<Dictionary> payload;
-  bool buildNow = false;
+  bool buildsNow = false;
   {
     const std::lock_guard lock(mutex_);
-    buildNow = building_ == Building::kWhenSent;
+    records_.push_back({{std::move(eventName), std::nullopt}, std::move(builder)});
+    buildsNow = building_ == Building::kWhenSent;
   }
-  if (buildNow) payload = std::exchange(builder, nullptr)();
+  if (buildsNow) std::thread([this] { buildPayloads(); }).join();
+}
+
+bool FakeAnalyticsService::buildsWhenRead() const {
   const std::lock_guard lock(mutex_);
-  records_.push_back({{std::move(eventName), std::move(payload)}, std::move(builder)});
+  return building_ == Building::kWhenRead;
 }
 
 }  // namespace halvox::platform

@@ -12,11 +12,13 @@
 
 namespace halvox::platform {
 
-// An analytics service that keeps what it was sent. At first every name is wanted and payloads are
-// built as they are sent. Any thread may call; the test reads from its own.
+// An analytics service that keeps what it was sent. At first every name is wanted. A payload is
+// never built by the sender, but later: when the test reads the events or, if it says so,
+// only when told. Any thread may call; the test reads from its own.
 class FakeAnalyticsService final : public AnalyticsService {
  public:
-  enum class Building : unsigned char { kWhenSent, kWhenTold };
+  // kWhenSent: on another thread, as by a store whose writer is faster than the sender.
+  enum class Building : unsigned char { kWhenRead, kWhenTold, kWhenSent };
   struct Event {
     std::string name;
     std::optional<Dictionary> payload;  // none until it was built
@@ -29,8 +31,9 @@ class FakeAnalyticsService final : public AnalyticsService {
   // From now on only these names are wanted; none at all with an empty set.
   void wantOnly(std::set<std::string, std::less<>> names);
   void setBuilding(Building building);
-  // Builds the payloads that are not built yet, in the order of their sending, on this thread.
-  void buildPayloads();
+  // Builds the payloads that are not built yet, in the order of their sending, on this thread; lets
+  // go of their builders.
+  void buildPayloads() const;
   // Forgets what was asked, sent and not built yet.
   void clear();
 
@@ -49,11 +52,13 @@ class FakeAnalyticsService final : public AnalyticsService {
     AnalyticsPayloadBuilder builder;  // empty once the payload is built
   };
 
+  [[nodiscard]] bool buildsWhenRead() const;
+
   Journal& journal_;
   mutable std::mutex mutex_;
   std::optional<std::set<std::string, std::less<>>> wanted_;  // none: everything
-  Building building_ = Building::kWhenSent;
-  std::vector<Record> records_;
+  Building building_ = Building::kWhenRead;
+  mutable std::vector<Record> records_;  // reading builds
   std::vector<std::string> tested_;
 };
 

@@ -85,6 +85,12 @@ std::shared_ptr<FakeCall> FakeConnection::call(std::string_view method,
     throw std::invalid_argument("wrong number of arguments for " + std::string(method));
   }
   auto call = std::make_shared<FakeCall>(journal_, std::string(method));
+  if (target.access == MethodAccess::kOwner && user_ == FakeUser::kStranger) {
+    call->add(Error{.description = std::string(method) + " is for the service's owner",
+                    .name = "org.freedesktop.DBus.Error.AccessDenied"},
+              Value());
+    return call;
+  }
   const std::shared_ptr<ExportedObject> object = object_;  // a request may end the connection
   if (target.reporterIDs != nullptr && target.reporterIDs(arguments) > kMaxReporterIDs) {
     call->add(Error{.description = "message_reporter_ids = " + std::to_string(kMaxReporterIDs) +
@@ -109,6 +115,11 @@ void FakeConnection::invalidate() {
   if (std::exchange(ended_, true)) return;
   const DeliveryMark mark(*this, nullptr);
   if (invalidationHandler_) invalidationHandler_();
+  abandon();
+}
+
+void FakeConnection::abandon() {
+  ended_ = true;
   interruptionHandler_ = nullptr;
   invalidationHandler_ = nullptr;
   object_.reset();
@@ -134,21 +145,17 @@ void FakeConnection::setInvalidationHandler(std::function<void()> handler) {
   invalidationHandler_ = std::move(handler);
 }
 
-std::shared_ptr<FakeConnection> FakeConnectionService::connect(ProcessID pid) {
+std::shared_ptr<FakeConnection> FakeConnectionService::connect(ProcessID pid, FakeUser user) {
   if (listener_.delegate() == nullptr) throw std::logic_error("the listener has no delegate");
-  auto connection = std::make_shared<FakeConnection>(journal_, pid);
+  auto connection = std::make_shared<FakeConnection>(journal_, pid, user);
   connections_.push_back(connection);
   connection->accepted_ = listener_.delegate()->listenerShouldAcceptNewConnection(connection);
+  if (!connection->accepted_) connection->abandon();
   return connection;
 }
 
 void FakeConnectionService::clear() {
-  for (const std::shared_ptr<FakeConnection>& connection : connections_) {
-    connection->ended_ = true;
-    connection->interruptionHandler_ = nullptr;
-    connection->invalidationHandler_ = nullptr;
-    connection->object_.reset();
-  }
+  for (const std::shared_ptr<FakeConnection>& connection : connections_) connection->abandon();
   connections_.clear();
 }
 

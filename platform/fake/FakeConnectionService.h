@@ -39,6 +39,9 @@ class FakeCall {
 
 class FakeConnectionService;
 
+// Whose process a fake client is: the service's own user's or root's, or another's.
+enum class FakeUser : unsigned char { kOwner, kStranger };
+
 // A client's connection that the test plays: it sends requests, is interrupted and goes away.
 // All on the thread of the test, which stands for the connection's thread. Held by the service
 // until it is invalidated, and by the test.
@@ -46,11 +49,13 @@ class FakeConnection final : public NSXPCConnection {
  public:
   static constexpr std::size_t kMaxReporterIDs = 10'000;  // of one request, as by default
 
-  FakeConnection(Journal& journal, ProcessID pid) : journal_(journal), pid_(pid) {}
+  FakeConnection(Journal& journal, ProcessID pid, FakeUser user = FakeUser::kOwner)
+      : journal_(journal), pid_(pid), user_(user) {}
 
   // Delivers a request to the exported object and returns it with the answers so far; later answers
-  // are added to it. Throws when the connection was not resumed, has ended, has no such method, or
-  // when the number of arguments is not that of the method's signature.
+  // are added to it. A request for the owner is refused to a stranger. Throws when the connection
+  // was not resumed, has ended, has no such method, or when the number of arguments is not that of
+  // the method's signature.
   std::shared_ptr<FakeCall> call(std::string_view method, std::vector<Value> arguments = {});
   // The other end is gone though the connection might come back.
   void interrupt();
@@ -75,8 +80,12 @@ class FakeConnection final : public NSXPCConnection {
  private:
   friend class FakeConnectionService;
 
+  // Lets go of everything without calling a handler.
+  void abandon();
+
   Journal& journal_;
   const ProcessID pid_;
+  const FakeUser user_;
   bool accepted_ = false;
   bool resumed_ = false;
   bool ended_ = false;
@@ -109,8 +118,9 @@ class FakeConnectionService final : public ConnectionService {
   explicit FakeConnectionService(Journal& journal) : journal_(journal) {}
 
   // A new client of that process: shows the connection to the listener's delegate and returns it
-  // whether it was accepted or not. Throws when the listener has no delegate.
-  std::shared_ptr<FakeConnection> connect(ProcessID pid);
+  // whether it was accepted or not; one that was not has ended. Throws when the listener has no
+  // delegate.
+  std::shared_ptr<FakeConnection> connect(ProcessID pid, FakeUser user = FakeUser::kOwner);
   // Lets go of all connections without calling their handlers.
   void clear();
 

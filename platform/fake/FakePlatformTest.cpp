@@ -65,9 +65,21 @@ TEST_F(FakePlatformTest, AnalyticsWantsWhatItIsTold) {
             (std::vector<std::string>{"any", "some", "any", "any"}));
 }
 
+TEST_F(FakePlatformTest, AnalyticsBuildsPayloadsWhenTheyAreRead) {
+  int built = 0;
+  analytics().sendAnalyticsEventLazy("event", [&built] { return Dictionary{{"built", ++built}}; });
+  EXPECT_EQ(built, 0);
+  EXPECT_EQ(platform_.analytics.sentNames(), (std::vector<std::string>{"event"}));
+  EXPECT_EQ(built, 0);
+
+  EXPECT_EQ(platform_.analytics.events()[0].payload, (Dictionary{{"built", 1}}));
+  EXPECT_EQ(platform_.analytics.events()[0].payload, (Dictionary{{"built", 1}}));
+}
+
 TEST_F(FakePlatformTest, AnalyticsBuildsPayloadsAtOnceOrWhenTold) {
   int built = 0;
   const auto builder = [&built] { return Dictionary{{"built", ++built}}; };
+  platform_.analytics.setBuilding(FakeAnalyticsService::Building::kWhenSent);
   analytics().sendAnalyticsEventLazy("first", builder);
   platform_.analytics.setBuilding(FakeAnalyticsService::Building::kWhenTold);
   analytics().sendAnalyticsEventLazy("second", builder);

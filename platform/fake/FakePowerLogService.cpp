@@ -4,6 +4,12 @@
 
 namespace halvox::platform {
 
+Dictionary FakePowerLogService::Event::recorded() const {
+  Dictionary all = extra.value_or(Dictionary());
+  all.merge(payload);
+  return all;
+}
+
 std::vector<FakePowerLogService::Event> FakePowerLogService::events() const {
   const std::lock_guard lock(mutex_);
   return events_;

@@ -19,6 +19,8 @@ class FakePowerLogService final : public PowerLogService {
     std::string name;
     Dictionary payload;
     std::optional<Dictionary> extra;
+    // The payload with the entries that `extra` adds to it, as it is recorded.
+    [[nodiscard]] Dictionary recorded() const;
     friend bool operator==(const Event&, const Event&) = default;
   };
 

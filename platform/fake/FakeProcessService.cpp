@@ -1,15 +1,44 @@
 #include "platform/fake/FakeProcessService.h"
 
 #include <algorithm>
+#include <string_view>
 #include <utility>
 
 namespace halvox::platform {
+namespace {
 
-void FakeProcessService::addProcess(ProcessID pid, std::string commandName) {
-  constexpr std::size_t kLongestName = 15;  // as the port promises
-  commandName.resize(std::min(commandName.size(), kLongestName));
+// How many bytes the character at the start has; 0 for a byte that does not begin one. Overlong
+// forms and surrogates, which no test needs, count as characters.
+std::size_t characterLength(std::string_view text) {
+  const auto byteAt = [text](std::size_t index) { return static_cast<unsigned char>(text[index]); };
+  const unsigned char first = byteAt(0);
+  if (first < 0x80) return 1;
+  const std::size_t length = first >= 0xF0 ? 4 : first >= 0xE0 ? 3 : 2;
+  if (first < 0xC2 || first > 0xF4 || text.size() < length) return 0;
+  for (std::size_t index = 1; index < length; ++index) {
+    if ((byteAt(index) & 0xC0) != 0x80) return 0;
+  }
+  return length;
+}
+
+// The name as the port promises it.
+std::string recordedName(std::string_view name) {
+  constexpr std::size_t kLongestName = 15;
+  name = name.substr(0, kLongestName);
+  std::string result;
+  while (!name.empty()) {
+    const std::size_t length = characterLength(name);
+    result += length == 0 ? "\xEF\xBF\xBD" : name.substr(0, length);
+    name.remove_prefix(std::max<std::size_t>(length, 1));
+  }
+  return result;
+}
+
+}  // namespace
+
+void FakeProcessService::addProcess(ProcessID pid, std::string_view commandName) {
   const std::lock_guard lock(mutex_);
-  names_.insert_or_assign(pid, std::move(commandName));
+  names_.insert_or_assign(pid, recordedName(commandName));
 }
 
 void FakeProcessService::removeProcess(ProcessID pid) {

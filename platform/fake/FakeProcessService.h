@@ -3,6 +3,8 @@
 #include <functional>
 #include <map>
 #include <mutex>
+#include <string>
+#include <string_view>
 #include <vector>
 
 #include "platform/fake/Journal.h"
@@ -23,7 +25,7 @@ class FakeProcessService final : public ProcessService {
   // Does not own the journal, which must outlive it.
   explicit FakeProcessService(Journal& journal) : journal_(journal) {}
 
-  void addProcess(ProcessID pid, std::string commandName);
+  void addProcess(ProcessID pid, std::string_view commandName);
   void removeProcess(ProcessID pid);
   void setOwnName(std::string name);
   // Called before terminate() throws.

@@ -58,7 +58,17 @@ class ProcessHarness {
     service_.addProcess(kPID, commandName);
     return kPID;
   }
+  void renameProcess(ProcessID pid, const std::string& commandName) {
+    service_.addProcess(pid, commandName);
+  }
   void endProcess(ProcessID pid) { service_.removeProcess(pid); }
+  int exitStatusOf(int status) {
+    try {
+      service_.terminate(status);
+    } catch (const FakeTermination& termination) {
+      return termination.exitStatus;
+    }
+  }
 
  private:
   static constexpr ProcessID kPID = 12;

@@ -14,7 +14,11 @@ namespace halvox::platform::contract {
 // `Harness` is default-constructible and has
 //   ProcessService& service();
 //   ProcessID startProcess(const std::string& commandName);  a process of that name, running
+//   void renameProcess(ProcessID pid, const std::string& commandName);  such a one renames itself
 //   void endProcess(ProcessID pid);  ends such a one; afterwards it is gone
+//   int exitStatusOf(int status);
+//     the exit status of a process that calls terminate(status), of a copy if need be; -1 when the
+//     call returned or ran on
 template <typename Harness>
 class ProcessContract : public ::testing::Test {
  protected:
@@ -53,6 +57,33 @@ TYPED_TEST_P(ProcessContract, LongNameIsCutTo15Bytes) {
   EXPECT_EQ(record->commandName, "a-rather-long-p");
 }
 
+TYPED_TEST_P(ProcessContract, ProcessThatRenamesItselfHasItsNewNameAtOnce) {
+  const ProcessID pid = this->harness_.startProcess("player");
+  EXPECT_EQ(this->harness_.service().processRecord(pid)->commandName, "player");
+
+  this->harness_.renameProcess(pid, "recorder");
+  const std::optional<ProcessRecord> record = this->harness_.service().processRecord(pid);
+
+  this->harness_.endProcess(pid);
+  ASSERT_TRUE(record.has_value());
+  EXPECT_EQ(record->commandName, "recorder");
+}
+
+TYPED_TEST_P(ProcessContract, BytesOfANameThatAreNoTextAreReplaced) {
+  const ProcessID pid = this->harness_.startProcess("a\xFFz");
+
+  const std::optional<ProcessRecord> record = this->harness_.service().processRecord(pid);
+
+  this->harness_.endProcess(pid);
+  ASSERT_TRUE(record.has_value());
+  EXPECT_EQ(record->commandName, "a\xEF\xBF\xBDz");
+}
+
+TYPED_TEST_P(ProcessContract, TerminationEndsTheProcessWithItsStatusAndReturnsNever) {
+  EXPECT_EQ(this->harness_.exitStatusOf(2), 2);
+  EXPECT_EQ(this->harness_.exitStatusOf(0), 0);
+}
+
 TYPED_TEST_P(ProcessContract, VanishedProcessHasNoRecord) {
   const ProcessID pid = this->harness_.startProcess("player");
   this->harness_.endProcess(pid);
@@ -76,6 +107,9 @@ TYPED_TEST_P(ProcessContract, OwnProcessHasANumberAndAName) {
 
 REGISTER_TYPED_TEST_SUITE_P(ProcessContract, RecordNamesTheRunningProcess,
                             NameMayHoldBlanksAndParentheses, LongNameIsCutTo15Bytes,
+                            ProcessThatRenamesItselfHasItsNewNameAtOnce,
+                            BytesOfANameThatAreNoTextAreReplaced,
+                            TerminationEndsTheProcessWithItsStatusAndReturnsNever,
                             VanishedProcessHasNoRecord, NumbersThatAreNoProcessHaveNoRecord,
                             OwnProcessHasANumberAndAName);
 

@@ -58,34 +58,53 @@ class LibcClockHarness {
   linux_::LibcClockService service_;
 };
 
-// Children that do nothing but bear a name.
+// Children that do nothing but bear the names that they are told.
 class ProcfsHarness {
  public:
   ProcessService& service() { return service_; }
   ProcessID startProcess(const std::string& commandName) {
-    std::array<int, 2> ends{};
-    if (::pipe2(ends.data(), O_CLOEXEC) != 0) return -1;
-    UniqueFd ready(ends[0]);
-    UniqueFd tell(ends[1]);
+    std::array<int, 2> names{};
+    std::array<int, 2> done{};
+    if (::pipe2(names.data(), O_CLOEXEC) != 0 || ::pipe2(done.data(), O_CLOEXEC) != 0) return -1;
+    const UniqueFd namesToRead(names[0]);
+    const UniqueFd doneToWrite(done[1]);
+    names_.reset(names[1]);
+    done_.reset(done[0]);
     const pid_t child = ::fork();
-    if (child == 0) bearName(commandName.c_str(), tell.get());
-    tell.reset();
+    if (child == 0) bearNames(namesToRead.get(), doneToWrite.get());
+    renameProcess(child, commandName);
+    return child;
+  }
+  void renameProcess(ProcessID /*pid*/, const std::string& commandName) {
     char byte = 0;
-    return ::read(ready.get(), &byte, 1) == 1 ? child : -1;
+    ASSERT_GT(::write(names_.get(), commandName.c_str(), commandName.size() + 1), 0);
+    ASSERT_EQ(::read(done_.get(), &byte, 1), 1);
   }
   void endProcess(ProcessID pid) {
     ::kill(pid, SIGKILL);
     ::waitpid(pid, nullptr, 0);
   }
-
- private:
-  [[noreturn]] static void bearName(const char* name, int tell) {
-    ::prctl(PR_SET_PDEATHSIG, SIGKILL);
-    ::prctl(PR_SET_NAME, name);
-    if (::write(tell, "r", 1) != 1) ::_exit(1);
-    for (;;) ::pause();
+  int exitStatusOf(int status) {
+    const pid_t child = ::fork();
+    if (child == 0) service_.terminate(status);
+    int ended = 0;
+    ::waitpid(child, &ended, 0);
+    return WIFEXITED(ended) ? WEXITSTATUS(ended) : -1;
   }
 
+ private:
+  [[noreturn]] static void bearNames(int names, int done) {
+    ::prctl(PR_SET_PDEATHSIG, SIGKILL);
+    std::array<char, 64> name{};
+    while (::read(names, name.data(), name.size() - 1) > 0) {
+      ::prctl(PR_SET_NAME, name.data());
+      if (::write(done, "d", 1) != 1) break;
+    }
+    ::_exit(1);
+  }
+
+  UniqueFd names_;
+  UniqueFd done_;
   linux_::ProcfsProcessService service_;
 };
 

@@ -1,0 +1,340 @@
+#pragma once
+
+#include <array>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <thread>
+#include <utility>
+#include <vector>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "platform/connection.h"
+
+namespace halvox::platform::contract {
+
+// Who a client of the contract is to the service.
+enum class ContractUser : std::uint8_t { kOwner, kStranger };
+
+// What a client was answered: a text, or the name of an error.
+struct ContractAnswer {
+  std::string text;
+  std::string errorName;
+};
+
+// One request as the object saw it.
+struct SeenRequest {
+  std::string text;
+  ProcessID currentProcess = 0;  // 0: no connection was current
+  RequestToken token;
+};
+
+// The object that the contract exports. Any thread may call.
+class ContractObject final : public ExportedObject {
+ public:
+  // Does not own the service, which must outlive it.
+  explicit ContractObject(const ConnectionService& service) : service_(service) {}
+
+  void see(const Invocation& request) {
+    const NSXPCConnection* connection = service_.currentConnection();
+    const std::lock_guard held(mutex_);
+    seen_.push_back({.text = std::string(request.arguments[0].string()),
+                     .currentProcess = connection == nullptr ? 0 : connection->processIdentifier(),
+                     .token = service_.currentRequest()});
+  }
+  void keep(ReplyCallback reply) {
+    const std::lock_guard held(mutex_);
+    kept_ = std::move(reply);
+  }
+  // Answers the request that was kept, from a thread of its own.
+  void answerKept(const std::string& text) {
+    ReplyCallback reply;
+    {
+      const std::lock_guard held(mutex_);
+      reply = std::move(kept_);
+    }
+    std::thread([&] { reply(std::nullopt, text); }).join();
+  }
+  [[nodiscard]] std::vector<SeenRequest> seen() const {
+    const std::lock_guard held(mutex_);
+    return seen_;
+  }
+  [[nodiscard]] bool keepsOne() const {
+    const std::lock_guard held(mutex_);
+    return static_cast<bool>(kept_);
+  }
+
+ private:
+  const ConnectionService& service_;
+  mutable std::mutex mutex_;
+  std::vector<SeenRequest> seen_;
+  ReplyCallback kept_;
+};
+
+// The object's methods, each with one text: echo answers it, keep does not yet, fail answers an
+// error, end is for the owner and answers it.
+inline const NSXPCInterface& contractInterface() {
+  constexpr auto kEcho = +[](ExportedObject& object, Invocation&& request) {
+    static_cast<ContractObject&>(object).see(request);
+    request.reply(std::nullopt, request.arguments[0]);
+  };
+  constexpr auto kKeep = +[](ExportedObject& object, Invocation&& request) {
+    static_cast<ContractObject&>(object).see(request);
+    static_cast<ContractObject&>(object).keep(std::move(request.reply));
+  };
+  constexpr auto kFail = +[](ExportedObject& /*object*/, Invocation&& request) {
+    request.reply(Error{.description = "no", .name = "com.tarno.test.Error"}, Value());
+  };
+  constexpr MethodEffect kNoMore = MethodEffect::kHoldsNoMore;
+  static constexpr std::array kMethods{
+      InterfaceMethod{"echo", "s", "s", kNoMore, kEcho},
+      InterfaceMethod{"keep", "s", "s", kNoMore, kKeep},
+      InterfaceMethod{"fail", "s", "s", kNoMore, kFail},
+      InterfaceMethod{"end", "s", "s", kNoMore, kEcho, nullptr, MethodAccess::kOwner},
+  };
+  static constexpr NSXPCInterface kInterface{.name = "com.tarno.test.Contract",
+                                             .objectPath = "/com/tarno/test/contract",
+                                             .methods = kMethods};
+  return kInterface;
+}
+
+// Exports an object of its own for each client, and notes what happens to connections.
+class ContractDelegate final : public NSXPCListenerDelegate {
+ public:
+  explicit ContractDelegate(const ConnectionService& service) : service_(service) {}
+
+  bool listenerShouldAcceptNewConnection(
+      const std::shared_ptr<NSXPCConnection>& connection) override {
+    auto object = std::make_shared<ContractObject>(service_);
+    connection->setExportedInterface(contractInterface());
+    connection->setExportedObject(object);
+    connection->setInterruptionHandler([this] { note("interrupted"); });
+    connection->setInvalidationHandler([this] { note("invalidated"); });
+    const std::lock_guard held(mutex_);
+    events_.emplace_back("asked");
+    object_ = object;
+    process_ = connection->processIdentifier();
+    if (refuses_) return false;
+    connection->resume();
+    return true;
+  }
+
+  void refuse() {
+    const std::lock_guard held(mutex_);
+    refuses_ = true;
+  }
+  [[nodiscard]] std::vector<std::string> events() const {
+    const std::lock_guard held(mutex_);
+    return events_;
+  }
+  // The object of the last client; null once nobody else holds it.
+  [[nodiscard]] std::shared_ptr<ContractObject> object() const {
+    const std::lock_guard held(mutex_);
+    return object_.lock();
+  }
+  [[nodiscard]] ProcessID process() const {
+    const std::lock_guard held(mutex_);
+    return process_;
+  }
+
+ private:
+  void note(const char* event) {
+    const bool isCurrent = service_.currentConnection() != nullptr;
+    const bool isRequest = service_.currentRequest() != nullptr;
+    const std::lock_guard held(mutex_);
+    events_.push_back(std::string(event) + (isCurrent && !isRequest ? "" : ", wrongly marked"));
+  }
+
+  const ConnectionService& service_;
+  mutable std::mutex mutex_;
+  bool refuses_ = false;
+  std::vector<std::string> events_;
+  std::weak_ptr<ContractObject> object_;
+  ProcessID process_ = 0;
+};
+
+// What every ConnectionService promises.
+//
+// `Harness` is default-constructible and has
+//   ConnectionService& service();
+//   void serve(NSXPCListenerDelegate& delegate);  once, before the first client
+//   void end();  serves no longer; nothing calls the delegate's objects afterwards
+//   bool canBe(ContractUser user);
+//   Client connect(ContractUser user);
+//   bool letHappen(const std::function<bool()>& condition);  false when it never does
+// and `Client` is movable and has
+//   ProcessID process();
+//   void post(const std::string& method, const std::string& text);  sends a request
+//   std::optional<ContractAnswer> answer();  to the oldest request; none when none comes
+//   void leave();  its end of the connection is gone
+template <typename Harness>
+class ConnectionContract : public ::testing::Test {
+ protected:
+  ConnectionContract() { harness_.serve(delegate_); }
+  ~ConnectionContract() override { harness_.end(); }
+
+  auto connect() { return harness_.connect(ContractUser::kOwner); }
+  template <typename Client>
+  static ContractAnswer call(Client& client, const std::string& method, const std::string& text) {
+    client.post(method, text);
+    return client.answer().value_or(ContractAnswer{.text = "none came", .errorName = {}});
+  }
+
+  Harness harness_;
+  ContractDelegate delegate_{harness_.service()};
+};
+TYPED_TEST_SUITE_P(ConnectionContract);
+
+TYPED_TEST_P(ConnectionContract, DelegateIsAskedOnceForEachClientWhoseProcessIsKnown) {
+  auto first = this->connect();
+  this->call(first, "echo", "a");
+  EXPECT_EQ(this->delegate_.process(), first.process());
+  auto second = this->connect();
+  this->call(second, "echo", "a");
+
+  EXPECT_THAT(this->delegate_.events(), ::testing::ElementsAre("asked", "asked"));
+}
+
+TYPED_TEST_P(ConnectionContract, RequestReachesTheObjectAndItsAnswerTheClient) {
+  auto client = this->connect();
+
+  const ContractAnswer answer = this->call(client, "echo", "hello");
+
+  EXPECT_EQ(answer.text, "hello");
+  EXPECT_EQ(answer.errorName, "");
+}
+
+TYPED_TEST_P(ConnectionContract, ErrorReachesTheClientUnderItsName) {
+  auto client = this->connect();
+
+  EXPECT_EQ(this->call(client, "fail", "a").errorName, "com.tarno.test.Error");
+}
+
+TYPED_TEST_P(ConnectionContract, RequestsOfAClientComeInTheirOrder) {
+  auto client = this->connect();
+
+  for (int number = 0; number < 100; ++number) client.post("echo", std::to_string(number));
+
+  for (int number = 0; number < 100; ++number) {
+    const auto answer = client.answer();
+    ASSERT_TRUE(answer.has_value());
+    ASSERT_EQ(answer->text, std::to_string(number));
+  }
+  const std::vector<SeenRequest> seen = this->delegate_.object()->seen();
+  for (std::size_t number = 0; number < 100; ++number) {
+    ASSERT_EQ(seen[number].text, std::to_string(number));
+  }
+}
+
+TYPED_TEST_P(ConnectionContract, ConnectionAndRequestAreCurrentDuringADeliveryOnly) {
+  auto client = this->connect();
+  this->call(client, "echo", "a");
+  this->call(client, "echo", "b");
+
+  const std::vector<SeenRequest> seen = this->delegate_.object()->seen();
+
+  ASSERT_EQ(seen.size(), 2U);
+  for (const SeenRequest& request : seen) {
+    EXPECT_EQ(request.currentProcess, client.process());
+    EXPECT_NE(request.token, nullptr);
+  }
+  EXPECT_NE(seen[0].token, seen[1].token) << "each request has a token of its own";
+  EXPECT_EQ(this->harness_.service().currentConnection(), nullptr);
+  EXPECT_EQ(this->harness_.service().currentRequest(), nullptr);
+}
+
+TYPED_TEST_P(ConnectionContract, LateAnswerOfAnotherThreadReachesTheClient) {
+  auto client = this->connect();
+  client.post("keep", "a");
+  ASSERT_TRUE(this->harness_.letHappen([&] {
+    const auto object = this->delegate_.object();
+    return object != nullptr && object->keepsOne();
+  }));
+
+  this->delegate_.object()->answerKept("late");
+
+  const auto answer = client.answer();
+  ASSERT_TRUE(answer.has_value());
+  EXPECT_EQ(answer->text, "late");
+}
+
+TYPED_TEST_P(ConnectionContract, AnswerToAClientThatHasGoneDoesNothing) {
+  auto client = this->connect();
+  client.post("keep", "a");
+  ASSERT_TRUE(this->harness_.letHappen([&] {
+    const auto object = this->delegate_.object();
+    return object != nullptr && object->keepsOne();
+  }));
+  const std::shared_ptr<ContractObject> object = this->delegate_.object();
+  client.leave();
+  ASSERT_TRUE(this->harness_.letHappen([&] { return this->delegate_.events().size() == 3; }));
+
+  object->answerKept("too late");
+
+  auto other = this->connect();
+  EXPECT_EQ(this->call(other, "echo", "still here").text, "still here");
+}
+
+TYPED_TEST_P(ConnectionContract, ClientThatVanishesIsInterruptedThenInvalidated) {
+  auto client = this->connect();
+  this->call(client, "echo", "a");
+
+  client.leave();
+
+  ASSERT_TRUE(this->harness_.letHappen([&] { return this->delegate_.events().size() >= 3; }));
+  EXPECT_THAT(this->delegate_.events(),
+              ::testing::ElementsAre("asked", "interrupted", "invalidated"));
+}
+
+TYPED_TEST_P(ConnectionContract, ObjectIsHeldUntilItsConnectionHasEnded) {
+  auto client = this->connect();
+  this->call(client, "echo", "a");
+  EXPECT_NE(this->delegate_.object(), nullptr);
+
+  client.leave();
+
+  EXPECT_TRUE(this->harness_.letHappen([&] { return this->delegate_.object() == nullptr; }));
+}
+
+TYPED_TEST_P(ConnectionContract, RefusedConnectionLetsGoOfItsObjectAndCallsNoHandler) {
+  this->delegate_.refuse();
+  auto client = this->connect();
+
+  ASSERT_TRUE(this->harness_.letHappen(
+      [&] { return !this->delegate_.events().empty() && this->delegate_.object() == nullptr; }));
+  client.leave();
+  this->harness_.end();
+
+  EXPECT_THAT(this->delegate_.events(), ::testing::ElementsAre("asked"));
+}
+
+TYPED_TEST_P(ConnectionContract, RequestForTheOwnerIsDeliveredFromTheOwner) {
+  auto client = this->connect();
+
+  EXPECT_EQ(this->call(client, "end", "a").text, "a");
+}
+
+TYPED_TEST_P(ConnectionContract, RequestForTheOwnerIsRefusedToOthersAndNotDelivered) {
+  if (!this->harness_.canBe(ContractUser::kStranger)) GTEST_SKIP() << "cannot be another user";
+  auto client = this->harness_.connect(ContractUser::kStranger);
+
+  EXPECT_EQ(this->call(client, "end", "a").errorName, "org.freedesktop.DBus.Error.AccessDenied");
+
+  EXPECT_EQ(this->delegate_.object()->seen().size(), 0U);
+  EXPECT_EQ(this->call(client, "echo", "b").text, "b");
+}
+
+REGISTER_TYPED_TEST_SUITE_P(
+    ConnectionContract, DelegateIsAskedOnceForEachClientWhoseProcessIsKnown,
+    RequestReachesTheObjectAndItsAnswerTheClient, ErrorReachesTheClientUnderItsName,
+    RequestsOfAClientComeInTheirOrder, ConnectionAndRequestAreCurrentDuringADeliveryOnly,
+    LateAnswerOfAnotherThreadReachesTheClient, AnswerToAClientThatHasGoneDoesNothing,
+    ClientThatVanishesIsInterruptedThenInvalidated, ObjectIsHeldUntilItsConnectionHasEnded,
+    RefusedConnectionLetsGoOfItsObjectAndCallsNoHandler, RequestForTheOwnerIsDeliveredFromTheOwner,
+    RequestForTheOwnerIsRefusedToOthersAndNotDelivered);
+
+}  // namespace halvox::platform::contract

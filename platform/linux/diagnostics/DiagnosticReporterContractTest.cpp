@@ -1,0 +1,37 @@
+// The contract of diagnostic reporters, kept by the service that captures.
+
+#include "platform/fake/contracts/DiagnosticReporterContract.h"
+
+#include <chrono>
+
+#include "platform/linux/diagnostics/SnapshotTestSupport.h"
+
+namespace halvox::platform::contract {
+namespace {
+
+// A service on fakes in a scratch directory.
+class SnapshotHarness : private linux_::SnapshotTest {
+ public:
+  SnapshotHarness() { start(); }
+
+  DiagnosticReporterService& service() { return *SnapshotTest::service; }
+  bool letReply(const std::function<bool()>& condition) {
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    while (!condition()) {
+      if (std::chrono::steady_clock::now() > deadline) return false;
+      platform.dispatch.advance(std::chrono::milliseconds(1));
+      std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    }
+    return true;
+  }
+  void end() { SnapshotTest::service->stop(); }
+
+ private:
+  void TestBody() override {}
+};
+
+}  // namespace
+
+INSTANTIATE_TYPED_TEST_SUITE_P(Snapshot, DiagnosticReporterContract, SnapshotHarness);
+
+}  // namespace halvox::platform::contract
