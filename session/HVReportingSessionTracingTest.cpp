@@ -162,6 +162,26 @@ TEST_F(HVReportingSessionTracingTest, LinkIsAskedForBeforeTheTraceIsSetUp) {
   session_->stop();
 }
 
+// A trace may begin and fail while it is asked to start.
+TEST_F(HVReportingSessionTracingTest, SessionIsMarkedAsTracedBeforeTheTraceIsAskedToStart) {
+  std::vector<std::string> asked;
+  platform_.journal.whenRecorded([&](const platform::JournalEntry& entry) {
+    if (entry.text != "trace start" && entry.text != "ktrace create") return;
+    EXPECT_TRUE(session_->startedTracing()) << entry.text;
+    asked.push_back(entry.text);
+  });
+
+  session_->start();
+  platform_.performanceTraces.completeAtStop("file:///one");
+  session_->stop();
+  EXPECT_EQ(asked, Texts{"trace start"});
+  chooseRunner();
+  session_->start();
+  session_->stop();
+
+  EXPECT_EQ(asked, (Texts{"trace start", "ktrace create"}));
+}
+
 TEST_F(HVReportingSessionTracingTest, SettingUpTheRunnerIsLoggedByTheSession) {
   chooseRunner();
 

@@ -2,12 +2,24 @@
 
 #include <algorithm>
 #include <ostream>
+#include <utility>
 
 namespace halvox::platform {
 
 void Journal::record(JournalKind kind, std::string_view text) {
+  std::function<void(const JournalEntry&)> handler;
+  const JournalEntry entry{kind, std::string(text)};
+  {
+    const std::lock_guard lock(mutex_);
+    entries_.push_back(entry);
+    handler = handler_;
+  }
+  if (handler) handler(entry);
+}
+
+void Journal::whenRecorded(std::function<void(const JournalEntry&)> handler) {
   const std::lock_guard lock(mutex_);
-  entries_.push_back({kind, std::string(text)});
+  handler_ = std::move(handler);
 }
 
 void Journal::clear() {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <mutex>
 #include <string>
 #include <string_view>
@@ -37,6 +38,8 @@ class Journal {
   // Lets a test mark its own steps.
   void note(std::string_view text) { record(JournalKind::kNote, text); }
   void clear();
+  // Called after each entry by whoever records it, so that a test can look at the state in between.
+  void whenRecorded(std::function<void(const JournalEntry&)> handler);
 
   [[nodiscard]] std::vector<JournalEntry> entries() const;
   // The entries of the kinds named, in their order.
@@ -48,6 +51,7 @@ class Journal {
  private:
   mutable std::mutex mutex_;
   std::vector<JournalEntry> entries_;
+  std::function<void(const JournalEntry&)> handler_;
 };
 
 // For the messages of failed tests.
