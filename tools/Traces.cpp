@@ -270,7 +270,8 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
   const ParamsFindings found = checkParams(params);
   const bool isUsable = found.intervals > 0;
   for (const std::string& reason : found.reasons) {
-    const std::string text = params + ": " + reason;
+    std::string text = params;
+    text.append(": ").append(reason);
     isUsable ? complain.warn(text) : static_cast<void>(complain(ExitStatus::kBadArguments, text));
   }
   if (!isUsable) return ExitStatus::kBadArguments;
