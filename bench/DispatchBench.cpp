@@ -7,9 +7,9 @@
 
 #include <benchmark/benchmark.h>
 
-#include "platform/linux/runtime/AsioDispatchService.h"
+#include "platform/linux/dispatch/AsioDispatchService.h"
+#include "platform/linux/log/SpdlogLogService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
-#include "platform/linux/runtime/SpdlogLogService.h"
 
 namespace {
 

@@ -15,9 +15,9 @@
 #include <nats/nats.h>
 
 #include "bench/NullPlatform.h"
+#include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/link/nats/NatsHandles.h"
 #include "platform/linux/link/nats/NatsTlmReporting.h"
-#include "platform/linux/runtime/AsioDispatchService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 
 namespace {

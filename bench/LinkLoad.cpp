@@ -27,7 +27,7 @@
 
 #include "bench/load/Report.h"
 #include "bench/load/Server.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/link/nats/NatsHandles.h"
 
 namespace halvox::bench {

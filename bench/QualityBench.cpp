@@ -16,9 +16,9 @@
 #include <thread>
 #include <vector>
 
-#include "platform/linux/runtime/AsioDispatchService.h"
+#include "platform/linux/dispatch/AsioDispatchService.h"
+#include "platform/linux/log/SpdlogLogService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
-#include "platform/linux/runtime/SpdlogLogService.h"
 
 namespace {
 

@@ -19,8 +19,8 @@
 #include "client/PeerBus.h"
 #include "client/SessionTable.h"
 #include "client/SocketWatch.h"
-#include "platform/linux/Mutex.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/Mutex.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::client {
 

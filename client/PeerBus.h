@@ -13,7 +13,7 @@
 #include "client/MessageRing.h"
 #include "client/ServicePlaces.h"
 #include "client/SessionTable.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 // The requests of the service's protocol as messages of a peer-to-peer D-Bus connection.
 namespace halvox::client {

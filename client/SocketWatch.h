@@ -3,7 +3,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::client {
 

@@ -13,8 +13,8 @@
 #include <systemd/sd-bus.h>
 
 #include "client/HalvoxClient.h"
-#include "platform/linux/Mutex.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/Mutex.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::client {

@@ -5,7 +5,7 @@
 /* The same definition as the service's own provider has: one event, whoever emits it. */
 #define LTTNG_UST_TRACEPOINT_CREATE_PROBES
 #define LTTNG_UST_TRACEPOINT_DEFINE
-#include "platform/linux/runtime/lttng/kdebug_provider.h"
+#include "platform/linux/kdebug/lttng/kdebug_provider.h"
 
 const int* const halvox_trace_state = &lttng_ust_tracepoint_halvox___kdebug.state;
 

@@ -11,7 +11,7 @@
 
 #include "platform/connection.h"
 #include "platform/linux/LinuxPlatform.h"
-#include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/configuration/Configuration.h"
 #include "platform/linux/runtime/Version.h"
 #include "platform/services.h"
 #include "service/HVReportingServiceDelegate.h"

@@ -15,7 +15,7 @@
 
 #include "client/TestService.h"
 #include "platform/fake/FakePlatform.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/store/SqliteAnalyticsService.h"
 #include "platform/linux/store/SqliteStore.h"
 

@@ -13,7 +13,7 @@
 
 #include "client/TestService.h"
 #include "platform/fake/FakePlatform.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/diagnostics/SnapshotArchive.h"
 #include "platform/linux/store/SqliteStore.h"
 

@@ -16,7 +16,7 @@
 #include <rapidjson/stringbuffer.h>
 #include <rapidjson/writer.h>
 
-#include "platform/linux/runtime/Utf8.h"
+#include "platform/linux/base/Utf8.h"
 #include "tools/JsonError.h"
 
 namespace halvox::tools {

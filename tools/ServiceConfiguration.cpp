@@ -9,7 +9,7 @@
 #include <sys/stat.h>
 
 #include "client/ServicePlaces.h"
-#include "platform/linux/runtime/ConfigurationEnvironment.h"
+#include "platform/linux/configuration/ConfigurationEnvironment.h"
 
 namespace halvox::tools {
 namespace {

@@ -4,7 +4,7 @@
 #include <string>
 #include <variant>
 
-#include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/configuration/Configuration.h"
 #include "tools/Complaint.h"
 
 namespace halvox::tools {

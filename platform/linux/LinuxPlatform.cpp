@@ -5,8 +5,8 @@
 
 #include <sysexits.h>
 
+#include "platform/linux/configuration/ConfigurationEnvironment.h"
 #include "platform/linux/drivers/ConfiguredSources.h"
-#include "platform/linux/runtime/ConfigurationEnvironment.h"
 #include "platform/log.h"
 
 namespace halvox::platform::linux_ {

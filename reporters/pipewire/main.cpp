@@ -10,7 +10,7 @@
 #include <fmt/format.h>
 
 #include "client/HalvoxClient.h"
-#include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/configuration/Configuration.h"
 #include "reporters/pipewire/HalvoxReportingClient.h"
 #include "reporters/pipewire/MainLoop.h"
 #include "reporters/pipewire/PipeWireSource.h"

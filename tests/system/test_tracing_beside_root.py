@@ -10,7 +10,7 @@ from pathlib import Path
 from harness import BIN, WITH_US, require
 
 HERE = Path(__file__).parent
-KDEBUG = HERE.parents[1] / "platform/linux/runtime/lttng"
+KDEBUG = HERE.parents[1] / "platform/linux/kdebug/lttng"
 TESTS = ["test_tracing.KernelTraceTest.test_matching_by_process_takes_events_of_any_thread",
          "test_tracing.PerformanceTraceTest.test_trace_becomes_an_archive_that_other_tools_read",
          "test_tracing.ToolTest.test_program_is_traced_shown_and_exported",

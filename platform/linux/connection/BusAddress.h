@@ -5,7 +5,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/configuration/Configuration.h"
 
 namespace halvox::platform::linux_ {
 

@@ -12,7 +12,7 @@
 #include <variant>
 #include <vector>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/BusAddress.h"
 #include "platform/linux/connection/FrameBuffer.h"
 #include "platform/linux/connection/LinuxConnectionService.h"

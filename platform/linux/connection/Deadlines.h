@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <optional>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/EventLoop.h"
 
 namespace halvox::platform::linux_ {

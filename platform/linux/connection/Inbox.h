@@ -7,8 +7,8 @@
 #include <vector>
 
 #include "platform/connection.h"
-#include "platform/linux/Mutex.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/Mutex.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/EventLoop.h"
 
 namespace halvox::platform::linux_ {

@@ -10,10 +10,10 @@
 #include <string>
 
 #include "platform/connection.h"
+#include "platform/linux/configuration/Configuration.h"
 #include "platform/linux/connection/BusAddress.h"
 #include "platform/linux/connection/ConnectionLimits.h"
-#include "platform/linux/runtime/Backpressure.h"
-#include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/dispatch/Backpressure.h"
 
 namespace halvox::platform::linux_ {
 

@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/Deadlines.h"
 #include "platform/linux/connection/EventLoop.h"
 

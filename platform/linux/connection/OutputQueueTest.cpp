@@ -6,7 +6,7 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 namespace {

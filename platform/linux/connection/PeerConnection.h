@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/ClientConnection.h"
 #include "platform/linux/connection/Deadlines.h"
 #include "platform/linux/connection/SocketStream.h"

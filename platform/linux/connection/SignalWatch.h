@@ -3,7 +3,7 @@
 #include <cstdint>
 #include <functional>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/EventLoop.h"
 
 namespace halvox::platform::linux_ {

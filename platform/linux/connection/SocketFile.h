@@ -7,7 +7,7 @@
 
 #include <sys/types.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
 
 namespace halvox::platform::linux_ {

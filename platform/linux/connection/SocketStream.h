@@ -3,7 +3,7 @@
 #include <cstddef>
 #include <cstdint>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/EventLoop.h"
 #include "platform/linux/connection/FrameBuffer.h"
 #include "platform/linux/connection/OutputQueue.h"

@@ -7,7 +7,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/Introspection.h"
 #include "platform/linux/connection/testing/BusClient.h"
 #include "platform/linux/connection/testing/ServiceUnderTest.h"

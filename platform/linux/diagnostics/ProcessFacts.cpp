@@ -9,8 +9,8 @@
 #include <system_error>
 #include <vector>
 
+#include "platform/linux/base/Utf8.h"
 #include "platform/linux/diagnostics/BoundedFile.h"
-#include "platform/linux/runtime/Utf8.h"
 
 namespace halvox::platform::linux_ {
 namespace {

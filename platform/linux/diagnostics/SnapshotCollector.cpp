@@ -6,7 +6,7 @@
 
 #include <poll.h>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/diagnostics/Child.h"
 #include "platform/linux/diagnostics/FileTree.h"
 #include "platform/linux/diagnostics/ProcessFacts.h"

@@ -12,7 +12,7 @@
 #include "platform/linux/diagnostics/SnapshotArchive.h"
 #include "platform/linux/diagnostics/SystemFacts.h"
 #include "platform/linux/diagnostics/WaitableFlag.h"
-#include "platform/linux/runtime/LogMemory.h"
+#include "platform/linux/log/LogMemory.h"
 #include "platform/linux/store/PayloadEncoder.h"
 #include "platform/value.h"
 

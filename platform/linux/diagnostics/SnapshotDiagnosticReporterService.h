@@ -9,7 +9,7 @@
 #include "platform/diagnostic_reporter.h"
 #include "platform/linux/diagnostics/SnapshotRecorder.h"
 #include "platform/linux/diagnostics/SystemFacts.h"
-#include "platform/linux/runtime/LogMemory.h"
+#include "platform/linux/log/LogMemory.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {

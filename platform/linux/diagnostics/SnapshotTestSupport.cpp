@@ -9,7 +9,7 @@
 #include <archive.h>
 #include <archive_entry.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 namespace {

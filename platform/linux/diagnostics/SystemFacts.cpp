@@ -5,9 +5,9 @@
 
 #include <sys/utsname.h>
 
+#include "platform/linux/base/Utf8.h"
 #include "platform/linux/diagnostics/BoundedFile.h"
 #include "platform/linux/diagnostics/Child.h"
-#include "platform/linux/runtime/Utf8.h"
 
 namespace halvox::platform::linux_ {
 namespace {

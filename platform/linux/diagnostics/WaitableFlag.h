@@ -3,7 +3,7 @@
 #include <atomic>
 #include <chrono>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 

@@ -3,8 +3,8 @@
 #include <memory>
 #include <vector>
 
+#include "platform/linux/configuration/Configuration.h"
 #include "platform/linux/drivers/DriverSource.h"
-#include "platform/linux/runtime/Configuration.h"
 
 namespace halvox::platform::linux_ {
 

@@ -6,7 +6,7 @@
 #include <unordered_set>
 #include <utility>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/drivers/DriverSamples.h"
 
 namespace halvox::platform::linux_ {

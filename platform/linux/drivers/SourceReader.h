@@ -5,7 +5,7 @@
 #include <memory>
 #include <thread>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/drivers/DriverSource.h"
 #include "platform/statistics.h"
 

@@ -7,7 +7,7 @@
 #include <string_view>
 
 #include "platform/connection.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 

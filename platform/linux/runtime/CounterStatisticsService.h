@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {

@@ -7,8 +7,8 @@
 #include <fcntl.h>
 #include <unistd.h>
 
-#include "platform/linux/UniqueHandle.h"
-#include "platform/linux/runtime/Utf8.h"
+#include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/base/Utf8.h"
 
 namespace halvox::platform::linux_ {
 namespace {

@@ -11,7 +11,7 @@
 #include <system_error>
 #include <vector>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 

@@ -11,7 +11,7 @@
 #include <sys/eventfd.h>
 #include <unistd.h>
 
-#include "platform/linux/runtime/ThreadSetup.h"
+#include "platform/linux/base/ThreadSetup.h"
 #include "platform/linux/settings/LinkedFiles.h"
 #include "platform/linux/settings/PreferenceFile.h"
 #include "platform/linux/settings/SettingNames.h"

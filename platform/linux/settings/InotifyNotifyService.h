@@ -9,8 +9,8 @@
 #include <thread>
 #include <vector>
 
-#include "platform/linux/Mutex.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/Mutex.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/settings/DirectoryWatch.h"
 #include "platform/linux/settings/WatchedSettings.h"
 #include "platform/notify.h"

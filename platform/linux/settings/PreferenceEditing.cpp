@@ -6,8 +6,8 @@
 #include <optional>
 #include <utility>
 
-#include "platform/linux/runtime/TomlNesting.h"
-#include "platform/linux/runtime/Utf8.h"
+#include "platform/linux/base/Utf8.h"
+#include "platform/linux/configuration/TomlNesting.h"
 #include "platform/linux/settings/SettingNames.h"
 #include "platform/linux/settings/TomlValues.h"
 

@@ -9,9 +9,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "platform/linux/UniqueHandle.h"
-#include "platform/linux/runtime/TomlNesting.h"
-#include "platform/linux/runtime/Utf8.h"
+#include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/base/Utf8.h"
+#include "platform/linux/configuration/TomlNesting.h"
 #include "platform/linux/settings/SettingNames.h"
 #include "platform/linux/settings/TomlValues.h"
 

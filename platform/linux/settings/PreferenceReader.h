@@ -6,7 +6,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/value.h"
 
 namespace halvox::platform::linux_ {

@@ -1,6 +1,6 @@
 #include "platform/linux/settings/SettingNames.h"
 
-#include "platform/linux/runtime/Utf8.h"
+#include "platform/linux/base/Utf8.h"
 
 namespace halvox::platform::linux_ {
 namespace {

@@ -3,7 +3,7 @@
 #include <filesystem>
 #include <optional>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/store/StoreError.h"
 #include "platform/linux/store/StoreReader.h"
 

@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "platform/clock.h"
-#include "platform/linux/runtime/Backpressure.h"
+#include "platform/linux/dispatch/Backpressure.h"
 #include "platform/linux/store/AnalyticsRecords.h"
 #include "platform/linux/store/EventNames.h"
 #include "platform/linux/store/Retention.h"

@@ -6,7 +6,7 @@
 #include <string>
 #include <thread>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreExtent.h"
 

@@ -4,8 +4,8 @@
 #include <cstdint>
 #include <functional>
 
-#include "platform/linux/Mutex.h"
-#include "platform/linux/runtime/Backpressure.h"
+#include "platform/linux/base/Mutex.h"
+#include "platform/linux/dispatch/Backpressure.h"
 
 namespace halvox::platform::linux_ {
 

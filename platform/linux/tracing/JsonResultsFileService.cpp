@@ -11,10 +11,10 @@
 #include <rapidjson/stringbuffer.h>
 #include <rapidjson/writer.h>
 
+#include "platform/linux/base/Utf8.h"
 #include "platform/linux/files/FileError.h"
 #include "platform/linux/files/RootedDirectory.h"
 #include "platform/linux/files/UnfinishedFile.h"
-#include "platform/linux/runtime/Utf8.h"
 #include "platform/linux/tracing/TracingLog.h"
 
 namespace halvox::platform::linux_ {

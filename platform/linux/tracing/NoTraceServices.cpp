@@ -3,7 +3,7 @@
 #include <memory>
 #include <utility>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/tracing/TraceServices.h"
 #include "platform/services.h"
 

@@ -13,9 +13,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/base/Utf8.h"
 #include "platform/linux/files/FileError.h"
-#include "platform/linux/runtime/Utf8.h"
 #include "platform/linux/tracing/PropertyListShape.h"
 
 namespace halvox::platform::linux_ {

@@ -7,7 +7,7 @@
 
 #include <systemd/sd-bus.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 

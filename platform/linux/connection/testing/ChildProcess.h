@@ -6,7 +6,7 @@
 
 #include <sys/types.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 

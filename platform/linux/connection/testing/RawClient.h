@@ -9,7 +9,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/value.h"
 

@@ -10,7 +10,7 @@
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
 #include "platform/linux/connection/testing/TestInterface.h"
-#include "platform/linux/runtime/Backpressure.h"
+#include "platform/linux/dispatch/Backpressure.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {

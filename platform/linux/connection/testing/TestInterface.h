@@ -7,7 +7,7 @@
 #include <vector>
 
 #include "platform/connection.h"
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 
 namespace halvox::platform::linux_ {
 

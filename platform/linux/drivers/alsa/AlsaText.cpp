@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <charconv>
 
-#include "platform/linux/runtime/Utf8.h"
+#include "platform/linux/base/Utf8.h"
 
 namespace halvox::platform::linux_ {
 namespace {

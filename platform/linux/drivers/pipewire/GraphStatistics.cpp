@@ -3,8 +3,8 @@
 #include <algorithm>
 #include <span>
 
+#include "platform/linux/base/Utf8.h"
 #include "platform/linux/drivers/pipewire/PipewireChannel.h"
-#include "platform/linux/runtime/Utf8.h"
 
 namespace halvox::platform::linux_ {
 namespace {

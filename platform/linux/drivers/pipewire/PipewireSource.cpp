@@ -4,7 +4,7 @@
 
 #include <pipewire/pipewire.h>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/ReadingMaker.h"
 #include "platform/linux/drivers/pipewire/PipewireConnection.h"

@@ -7,7 +7,7 @@
 
 #include <pipewire/pipewire.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 

@@ -2,7 +2,7 @@
 
 #include <memory>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/drivers/pipewire/GraphStatistics.h"
 
 namespace halvox::platform::linux_ {

@@ -9,7 +9,7 @@
 #include <unordered_set>
 #include <utility>
 
-#include "platform/linux/runtime/Utf8.h"
+#include "platform/linux/base/Utf8.h"
 
 namespace halvox::platform::linux_ {
 namespace {

@@ -4,7 +4,7 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/linux/runtime/ThreadSetup.h"
+#include "platform/linux/base/ThreadSetup.h"
 
 namespace halvox::platform::linux_ {
 

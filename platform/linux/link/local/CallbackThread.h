@@ -5,7 +5,7 @@
 #include <thread>
 
 #include "platform/dispatch.h"
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 
 namespace halvox::platform::linux_ {
 

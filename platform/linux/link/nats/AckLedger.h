@@ -4,7 +4,7 @@
 #include <functional>
 #include <list>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 
 namespace halvox::platform::linux_ {
 

@@ -4,8 +4,8 @@
 #include <system_error>
 #include <utility>
 
+#include "platform/linux/base/ThreadSetup.h"
 #include "platform/linux/link/nats/NatsLog.h"
-#include "platform/linux/runtime/ThreadSetup.h"
 
 namespace halvox::platform::linux_ {
 namespace {

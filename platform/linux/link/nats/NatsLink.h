@@ -12,7 +12,7 @@
 #include <thread>
 #include <vector>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/link/nats/AckLedger.h"
 #include "platform/linux/link/nats/BurstLog.h"
 #include "platform/linux/link/nats/NatsHandles.h"

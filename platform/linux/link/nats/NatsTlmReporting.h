@@ -3,7 +3,7 @@
 #include <memory>
 
 #include "platform/dispatch.h"
-#include "platform/linux/runtime/Configuration.h"
+#include "platform/linux/configuration/Configuration.h"
 #include "platform/statistics.h"
 #include "platform/tlm_reporting.h"
 

@@ -22,10 +22,10 @@
 #include <unistd.h>
 
 #include "platform/fake/FakePlatform.h"
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/link/nats/NatsHandles.h"
 #include "platform/linux/link/nats/NatsTlmReporting.h"
-#include "platform/linux/runtime/AsioDispatchService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 

@@ -7,7 +7,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/tracing/lttng/SessionDaemon.h"
 
 namespace halvox::platform::linux_ {

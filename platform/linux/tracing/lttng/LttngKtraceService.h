@@ -4,7 +4,7 @@
 
 #include "platform/dispatch.h"
 #include "platform/ktrace.h"
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/tracing/lttng/LttngControl.h"
 #include "platform/statistics.h"
 

@@ -3,7 +3,7 @@
 #include <memory>
 
 #include "platform/dispatch.h"
-#include "platform/linux/Mutex.h"
+#include "platform/linux/base/Mutex.h"
 #include "platform/linux/tracing/lttng/LttngControl.h"
 #include "platform/performance_trace.h"
 #include "platform/statistics.h"

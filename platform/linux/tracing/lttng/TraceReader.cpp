@@ -8,7 +8,7 @@
 
 #include <babeltrace2/babeltrace.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 namespace {

@@ -25,7 +25,7 @@
 #include <sys/file.h>
 #include <unistd.h>
 
-#include "platform/linux/UniqueHandle.h"
+#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/tracing/lttng/DaemonProcess.h"
 #include "platform/linux/tracing/lttng/TracerSessions.h"
 

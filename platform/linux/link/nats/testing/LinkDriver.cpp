@@ -23,9 +23,9 @@
 #include <variant>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/configuration/Configuration.h"
+#include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/link/nats/NatsTlmReporting.h"
-#include "platform/linux/runtime/AsioDispatchService.h"
-#include "platform/linux/runtime/Configuration.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 
 namespace {

@@ -1,0 +1,330 @@
+#include "platform/linux/configuration/Configuration.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <cstdlib>
+#include <limits>
+#include <system_error>
+
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/base/Utf8.h"
+#include "platform/linux/configuration/ConfigurationEnvironment.h"
+#include "platform/linux/configuration/ConfigurationReader.h"
+#include "platform/linux/configuration/TomlNesting.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr std::size_t kLargestFile = 1U << 20U;
+constexpr std::size_t kLongestPath = 4000;
+constexpr std::size_t kLongestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
+constexpr std::size_t kLongestStreamName = 255;  // it becomes the name of a directory
+constexpr NumberRange kDays{1, 36'500};
+constexpr NumberRange kMegabytes{1, 1U << 20U};
+constexpr NumberRange kReplicas{1, 5};  // what JetStream takes
+constexpr NumberRange kSessions{1, 1'000'000'000};
+// One message to 10,000 sessions holds the others up for some hundredths of a second, one to the
+// greatest number for seconds.
+constexpr NumberRange kReporterIDs{1, 1'000'000};
+constexpr NumberRange kSnapshots{1, 10'000};
+
+const char* configurationVariable() {
+  const char* named = std::getenv("HALVOX_CONFIG");
+  return named != nullptr && *named != '\0' ? named : nullptr;
+}
+
+std::string oneLine(std::string_view text) {
+  std::string line;
+  appendEscaped(line, text, std::numeric_limits<std::size_t>::max());
+  return line;
+}
+
+ConfigurationError unreadable(const std::filesystem::path& file, int error) {
+  return {ConfigurationError::Kind::kUnreadable,
+          oneLine(fmt::format("{}: the configuration cannot be read: {}", file.native(),
+                              std::system_category().message(error)))};
+}
+
+// The file's text; none when there is no such file.
+std::variant<std::optional<std::string>, ConfigurationError> readText(
+    const std::filesystem::path& file) {
+  // Opening does not block, so that a pipe nobody writes to cannot hold up the start.
+  const UniqueFd descriptor(::open(file.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
+  if (!descriptor) {
+    if (errno == ENOENT || errno == ENOTDIR) return std::nullopt;
+    return unreadable(file, errno);
+  }
+  ::fcntl(descriptor.get(), F_SETFL, 0);
+  std::string text;
+  std::array<char, 16'384> buffer;
+  while (text.size() <= kLargestFile) {
+    const ssize_t count = ::read(descriptor.get(), buffer.data(), buffer.size());
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return unreadable(file, errno);
+    if (count == 0) return text;
+    text.append(buffer.data(), static_cast<std::size_t>(count));
+  }
+  return ConfigurationError{
+      ConfigurationError::Kind::kWrong,
+      oneLine(fmt::format("{}:1:1: the file: expected at most {} bytes, found more", file.native(),
+                          kLargestFile))};
+}
+
+bool isNotEmpty(std::string_view text) { return !text.empty(); }
+
+// Three octal digits after a zero, with which the owner may connect.
+bool isMode(std::string_view text) {
+  return text.size() == 4 && text[0] == '0' && (text[1] == '6' || text[1] == '7') &&
+         std::ranges::all_of(text, [](char digit) { return digit >= '0' && digit <= '7'; });
+}
+
+// Who may connect when the file does not say: the members of a group that it names; nobody else
+// when the socket is among the files of a login; every user to a service of the system, because
+// every user's programs report.
+std::uint32_t defaultMode(const Configuration::Listener& listener) {
+  constexpr std::uint32_t kUser = 0600;
+  constexpr std::uint32_t kGroup = 0660;
+  constexpr std::uint32_t kEverybody = 0666;
+  if (!listener.group.empty()) return kGroup;
+  const auto login = environmentPath("XDG_RUNTIME_DIR");
+  return login.has_value() && isBelow(listener.socket, *login) ? kUser : kEverybody;
+}
+
+void readMode(TableReader& table, Configuration::Listener& listener) {
+  constexpr int kOctal = 8;
+  std::string mode;
+  table.readText("mode", isMode, "permissions such as \"0660\", from \"0600\" to \"0777\"", mode);
+  listener.mode = mode.empty() ? defaultMode(listener)
+                               : static_cast<std::uint32_t>(std::stoul(mode, nullptr, kOctal));
+}
+
+void readListener(TableReader table, Configuration::Listener& listener) {
+  table.read("socket", listener.socket, kLongestSocketPath);
+  table.readText("group", isNotEmpty, "the name of a group", listener.group);
+  readMode(table, listener);
+  auto bus = static_cast<std::size_t>(listener.bus);
+  table.readChoice("bus", {"none", "session", "system"}, bus);
+  listener.bus = static_cast<BusKind>(bus);
+  table.readSeconds("handshake_seconds", listener.handshakeTimeout);
+  table.readSeconds("message_seconds", listener.messageTimeout);
+  table.finish();
+}
+
+void readStorage(TableReader table, Configuration::Storage& storage) {
+  std::filesystem::path root;
+  std::uint64_t days = storage.retentionDays;
+  std::uint64_t megabytes = storage.maxMegabytes;
+  table.read("directory", storage.directory, kLongestPath);
+  table.read("root", root, kLongestPath);
+  table.read("retention_days", kDays, days);
+  table.read("max_megabytes", kMegabytes, megabytes);
+  table.finish();
+  storage.root = root.empty() ? storage.directory / "root" : root;
+  storage.retentionDays = static_cast<std::uint32_t>(days);
+  storage.maxMegabytes = static_cast<std::uint32_t>(megabytes);
+}
+
+void readAnalytics(TableReader table, Configuration::Analytics& analytics) {
+  std::size_t sink = 0;
+  table.read("wanted", analytics.wanted);
+  // Another sink must not be taken for this one in silence: the events would go the wrong way.
+  table.readChoice("sink", {"sqlite"}, sink);
+  table.finish();
+}
+
+// Printable ASCII without blanks, as the names and addresses of the protocol have it.
+bool isGraphic(std::string_view text) {
+  return !text.empty() && std::ranges::all_of(text, [](char character) {
+    return character > ' ' && character <= '~';
+  });
+}
+
+bool isServerURL(std::string_view text) {
+  for (const std::string_view scheme : {"nats://", "tls://"}) {
+    if (text.starts_with(scheme)) return isGraphic(text.substr(scheme.size()));
+  }
+  return false;
+}
+
+// Names between single dots.
+bool isSubject(std::string_view text) {
+  return isGraphic(text) && text.find_first_of("*>") == std::string_view::npos &&
+         text.find("..") == std::string_view::npos && !text.starts_with('.') &&
+         !text.ends_with('.') && !text.starts_with('$');
+}
+
+bool isStreamName(std::string_view text) {
+  return isGraphic(text) && text.size() <= kLongestStreamName &&
+         text.find_first_of("*>./\\") == std::string_view::npos;
+}
+
+void readLinkTls(TableReader table, std::optional<Configuration::Link::Tls>& result) {
+  if (!table.isPresent()) return;
+  // Not emplace(), which clang 14 finds no constructor for.
+  Configuration::Link::Tls& tls = *(result = Configuration::Link::Tls{});
+  table.read("ca", tls.ca, kLongestPath);
+  table.read("certificate", tls.certificate, kLongestPath);
+  table.read("key", tls.key, kLongestPath);
+  table.read("verify", tls.verify);
+  // One of the two alone would be left out in silence, and the servers would refuse us.
+  if (tls.key.empty()) table.refuse("certificate", "a path together with link.tls.key");
+  if (tls.certificate.empty()) table.refuse("key", "a path together with link.tls.certificate");
+  table.finish();
+}
+
+void readLink(TableReader table, Configuration::Link& link) {
+  auto backend = static_cast<std::size_t>(link.backend);
+  table.readChoice("backend", {"local", "nats", "none"}, backend);
+  link.backend = static_cast<LinkBackend>(backend);
+  table.readTexts("servers", isServerURL, "addresses such as \"nats://127.0.0.1:4222\"",
+                  link.servers);
+  table.readText("subject", isSubject, "names between dots, without blanks, * and >", link.subject);
+  table.readText("stream", isStreamName, "a name without blanks, dots, *, >, / and \\",
+                 link.stream);
+  table.read("replicas", kReplicas, link.replicas);
+  readLinkTls(table.table("tls"), link.tls);
+  table.read("credentials", link.credentials, kLongestPath);
+  table.finish();
+}
+
+void readLimits(TableReader table, Configuration::Limits& limits) {
+  table.read("client_history_megabytes", kMegabytes, limits.clientHistoryMegabytes);
+  table.read("client_sessions", kSessions, limits.clientSessions);
+  table.read("message_reporter_ids", kReporterIDs, limits.messageReporterIDs);
+  table.finish();
+}
+
+void readLogLevel(TableReader& table, std::string_view key, LogLevel& level) {
+  auto chosen = static_cast<std::size_t>(level);
+  table.readChoice(key, {"debug", "info", "default", "error"}, chosen);
+  level = static_cast<LogLevel>(chosen);
+}
+
+void readLog(TableReader table, Configuration& configuration) {
+  readLogLevel(table, "level", configuration.logLevel);
+  readLogLevel(table, "memory_level", configuration.logMemoryLevel);
+  table.finish();
+}
+
+void readDiagnostics(TableReader table, std::uint32_t& keepSnapshots) {
+  std::uint64_t keep = keepSnapshots;
+  table.read("keep_snapshots", kSnapshots, keep);
+  keepSnapshots = static_cast<std::uint32_t>(keep);
+  table.finish();
+}
+
+void readFeatures(TableReader table, FeatureSwitches& features) {
+  for (auto& [domain, switches] : table.readTables()) features[domain] = switches.readSwitches();
+}
+
+void readDirectory(TableReader table, std::filesystem::path& directory) {
+  table.read("directory", directory, kLongestPath);
+  table.finish();
+}
+
+// What is below the storage directory unless it is put elsewhere.
+void setDefaultDirectories(Configuration& configuration) {
+  configuration.preferencesDirectory = configuration.storage.directory / "preferences";
+  configuration.notifyDirectory = configuration.storage.directory / "notify";
+  configuration.drivers.textfiles = configuration.storage.directory / "drivers";
+}
+
+void readDrivers(TableReader table, Configuration::Drivers& drivers) {
+  table.read("alsa", drivers.alsa);
+  table.read("alsa_root", drivers.alsaRoot, kLongestPath);
+  table.read("pipewire", drivers.pipewire);
+  table.read("textfiles", drivers.textfiles, kLongestPath);
+  table.finish();
+}
+
+std::variant<Configuration, ConfigurationError> parse(const std::string& file,
+                                                      std::string_view text,
+                                                      const DefaultPlaces& places) {
+  ConfigurationMistakes mistakes(file);
+  if (const auto line = lineNestedTooDeep(text)) {
+    mistakes.add(
+        {static_cast<toml::source_index>(*line), 1},
+        fmt::format("the file: expected at most {} levels of tables and arrays, found more",
+                    kDeepestNesting));
+    return *mistakes.first();
+  }
+  const toml::parse_result parsed = toml::parse(text);
+  if (!parsed) {
+    const toml::parse_error& error = parsed.error();
+    mistakes.add(error.source().begin,
+                 fmt::format("the file: expected TOML, found a mistake: {}", error.description()));
+    return *mistakes.first();
+  }
+  Configuration configuration = defaultConfiguration(places);
+  TableReader root(&parsed.table(), "", mistakes);
+  readListener(root.table("listener"), configuration.listener);
+  readStorage(root.table("storage"), configuration.storage);
+  setDefaultDirectories(configuration);
+  readDirectory(root.table("preferences"), configuration.preferencesDirectory);
+  readDirectory(root.table("notify"), configuration.notifyDirectory);
+  readAnalytics(root.table("analytics"), configuration.analytics);
+  readLink(root.table("link"), configuration.link);
+  readLimits(root.table("limits"), configuration.limits);
+  readLog(root.table("log"), configuration);
+  readDiagnostics(root.table("diagnostics"), configuration.keepSnapshots);
+  readFeatures(root.table("features"), configuration.features);
+  configuration.device = root.table("device").readValues();
+  readDrivers(root.table("drivers"), configuration.drivers);
+  root.finish();
+  if (mistakes.first().has_value()) return *mistakes.first();
+  return configuration;
+}
+
+}  // namespace
+
+std::filesystem::path configurationPath() {
+  if (const char* named = configurationVariable()) return named;
+  const std::filesystem::path own =
+      environmentPath("XDG_CONFIG_HOME").value_or(homeDirectory() / ".config") /
+      "halvox/halvox.toml";
+  const bool isMissing = ::access(own.c_str(), F_OK) != 0 && (errno == ENOENT || errno == ENOTDIR);
+  return isMissing ? "/etc/halvox/halvox.toml" : own;
+}
+
+DefaultPlaces placesOfService() { return {defaultSocketPath(), defaultStorageDirectory()}; }
+
+Configuration defaultConfiguration(const DefaultPlaces& places) {
+  Configuration configuration;
+  configuration.listener.socket = places.socket;
+  configuration.listener.mode = defaultMode(configuration.listener);
+  configuration.storage.directory = places.storageDirectory;
+  configuration.storage.root = configuration.storage.directory / "root";
+  setDefaultDirectories(configuration);
+  return configuration;
+}
+
+std::variant<Configuration, ConfigurationError> loadConfiguration(const DefaultPlaces& places) {
+  const std::filesystem::path file = configurationPath();
+  auto content = readText(file);
+  if (auto* error = std::get_if<ConfigurationError>(&content)) return std::move(*error);
+  const auto& text = std::get<std::optional<std::string>>(content);
+  if (text.has_value()) return parse(file.native(), *text, places);
+  if (configurationVariable() != nullptr) return unreadable(file, ENOENT);
+  return defaultConfiguration(places);
+}
+
+std::variant<std::filesystem::path, ConfigurationError> configuredSocket() {
+  // Without a socket of its own, so that one in the result is one that was named.
+  auto loaded = loadConfiguration({.socket = {}, .storageDirectory = defaultStorageDirectory()});
+  if (auto* configuration = std::get_if<Configuration>(&loaded)) {
+    return std::move(configuration->listener.socket);
+  }
+  auto& error = std::get<ConfigurationError>(loaded);
+  const bool isHidden =
+      error.kind == ConfigurationError::Kind::kUnreadable && configurationVariable() == nullptr;
+  if (isHidden) return std::filesystem::path();
+  return std::move(error);
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,77 @@
+#pragma once
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <map>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <variant>
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "platform/linux/configuration/Configuration.h"
+#include "platform/linux/testing/ScratchDirectory.h"
+
+namespace halvox::platform::linux_ {
+
+inline constexpr const char* kVariables[] = {"HALVOX_CONFIG",
+                                             "XDG_CONFIG_HOME",
+                                             "RUNTIME_DIRECTORY",
+                                             "XDG_RUNTIME_DIR",
+                                             "STATE_DIRECTORY",
+                                             "XDG_STATE_HOME",
+                                             "HOME"};
+
+// A scratch directory as home, and no other variable set that the configuration looks at.
+class ConfigurationTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    for (const char* variable : kVariables) {
+      if (const char* value = std::getenv(variable)) saved_[variable] = value;
+      ::unsetenv(variable);
+    }
+    ::setenv("HOME", directory_.c_str(), 1);
+  }
+  void TearDown() override {
+    for (const char* variable : kVariables) ::unsetenv(variable);
+    for (const auto& [variable, value] : saved_) ::setenv(variable.c_str(), value.c_str(), 1);
+  }
+
+  std::filesystem::path write(std::string_view text, const std::string& name = "halvox.toml") {
+    std::filesystem::path file = directory_ / name;
+    std::filesystem::create_directories(file.parent_path());
+    std::ofstream(file, std::ios::binary) << text;
+    return file;
+  }
+  std::variant<Configuration, ConfigurationError> load(std::string_view text) {
+    ::setenv("HALVOX_CONFIG", write(text).c_str(), 1);
+    return loadConfiguration();
+  }
+  Configuration loaded(std::string_view text) {
+    auto result = load(text);
+    if (const auto* error = std::get_if<ConfigurationError>(&result)) {
+      ADD_FAILURE() << error->description;
+      return {};
+    }
+    return std::get<Configuration>(std::move(result));
+  }
+  // What is wrong with that text, without the file's name.
+  std::string mistake(std::string_view text) {
+    const auto result = load(text);
+    const auto* error = std::get_if<ConfigurationError>(&result);
+    if (error == nullptr) return "(none)";
+    EXPECT_EQ(error->kind, ConfigurationError::Kind::kWrong);
+    const std::string prefix = (directory_ / "halvox.toml").native() + ":";
+    EXPECT_THAT(error->description, ::testing::StartsWith(prefix));
+    return error->description.substr(prefix.size());
+  }
+
+  const ScratchDirectory scratch_;
+  const std::filesystem::path directory_ = scratch_.path();
+  std::map<std::string, std::string> saved_;
+};
+
+}  // namespace halvox::platform::linux_

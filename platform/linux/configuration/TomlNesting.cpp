@@ -1,0 +1,109 @@
+#include "platform/linux/configuration/TomlNesting.h"
+
+#include <algorithm>
+#include <utility>
+#include <vector>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// Follows brackets and dots through a text, and passes over what is in quotes and comments.
+class NestingScan {
+ public:
+  explicit NestingScan(std::string_view text) : rest_(text) {}
+
+  // How much of the text has been read when it is too deep; none when it never is.
+  std::optional<std::size_t> find() {
+    const std::size_t size = rest_.size();
+    while (!rest_.empty()) {
+      take(rest_.front());
+      if (depth_ > kDeepestNesting) return size - rest_.size();
+    }
+    return std::nullopt;
+  }
+
+ private:
+  void take(char character) {
+    if (character == '"' || character == '\'') return skipQuoted(character);
+    if (character == '#') return skip(rest_.find('\n'));
+    rest_.remove_prefix(1);
+    const bool beginsLine = isLineStart_;
+    isLineStart_ = character == '\n' || (beginsLine && (character == ' ' || character == '\t'));
+    if (character == '.') {
+      deepen(1);
+    } else if (character == '[' || character == '{') {
+      open(beginsLine);
+    } else if (character == ']' || character == '}') {
+      close();
+    } else if (character == ',' || (character == '\n' && levels_.size() == 1)) {
+      forgetElement();
+    }
+  }
+
+  void deepen(std::size_t levels) {
+    levels_.back() += levels;
+    depth_ += levels;
+  }
+  // The key or number that came last, with its dots, is done with.
+  void forgetElement() {
+    depth_ -= levels_.back();
+    levels_.back() = 0;
+  }
+
+  // A bracket that begins a line outside all others begins the header of a table.
+  void open(bool beginsLine) {
+    if (levels_.size() == 1) {
+      isHeader_ = beginsLine;
+      if (isHeader_) depth_ -= std::exchange(header_, 0);
+    }
+    levels_.push_back(0);
+    deepen(1);
+  }
+
+  // What the header adds holds for all lines below it.
+  void close() {
+    if (levels_.size() == 1) return;
+    const std::size_t levels = levels_.back();
+    levels_.pop_back();
+    if (isHeader_) {
+      header_ += levels;
+    } else {
+      depth_ -= levels;
+    }
+  }
+
+  void skip(std::size_t count) {
+    rest_.remove_prefix(std::min(count, rest_.size()));
+    isLineStart_ = false;
+  }
+
+  void skipQuoted(char quote) {
+    const bool isLong = rest_.size() >= 3 && rest_[1] == quote && rest_[2] == quote;
+    const std::string_view end = rest_.substr(0, isLong ? 3 : 1);
+    skip(end.size());
+    while (!rest_.empty() && !rest_.starts_with(end)) {
+      if (!isLong && rest_.front() == '\n') return;
+      skip(quote == '"' && rest_.front() == '\\' ? 2 : 1);
+    }
+    skip(end.size());
+    // The last quotes of three may have up to two in front of them that are text.
+    for (int extra = 0; isLong && extra < 2 && rest_.starts_with(quote); ++extra) skip(1);
+  }
+
+  std::string_view rest_;
+  std::vector<std::size_t> levels_{0};  // of the current element in each open bracket
+  std::size_t header_ = 0;
+  std::size_t depth_ = 0;  // all of these together
+  bool isHeader_ = false;
+  bool isLineStart_ = true;
+};
+
+}  // namespace
+
+std::optional<std::size_t> lineNestedTooDeep(std::string_view text) {
+  const auto read = NestingScan(text).find();
+  if (!read.has_value()) return std::nullopt;
+  return static_cast<std::size_t>(std::ranges::count(text.substr(0, *read), '\n')) + 1;
+}
+
+}  // namespace halvox::platform::linux_

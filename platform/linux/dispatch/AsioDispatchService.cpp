@@ -1,0 +1,109 @@
+#include "platform/linux/dispatch/AsioDispatchService.h"
+
+#include <algorithm>
+#include <iterator>
+#include <string>
+#include <system_error>
+#include <utility>
+
+#include "platform/linux/dispatch/BatchedTurns.h"
+#include "platform/linux/dispatch/DispatchPool.h"
+#include "platform/linux/dispatch/JobRunner.h"
+#include "platform/linux/dispatch/OwnThreadQueue.h"
+#include "platform/linux/dispatch/SharedQueue.h"
+
+namespace halvox::platform::linux_ {
+
+AsioDispatchService::AsioDispatchService(LogService& log, StatisticsService& statistics)
+    : log_(log.createCategory("com.tarno.halvox", "dispatch")),
+      runner_(std::make_shared<JobRunner>(log, statistics)),
+      pool_(std::make_shared<DispatchPool>(runner_, statistics)) {}
+
+AsioDispatchService::~AsioDispatchService() { stop(std::chrono::hours(24 * 365)); }
+
+std::shared_ptr<DispatchQueue> AsioDispatchService::createSerialQueue(std::string_view label,
+                                                                      QualityOfService quality,
+                                                                      QueueThreading threading) {
+  if (threading == QueueThreading::kOwnThread) {
+    if (auto queue = createOwnThreadQueue(label, quality)) return queue;
+  }
+  return std::make_shared<SharedQueue>(pool_, label, quality);
+}
+
+std::shared_ptr<DispatchSemaphore> AsioDispatchService::createSemaphore(std::uint64_t signals) {
+  return std::make_shared<SharedSemaphore>(pool_, signals);
+}
+
+void AsioDispatchService::asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) {
+  pool_->delayedJobs().add(delay, QualityOfService::kBackground, std::move(job));
+}
+
+void AsioDispatchService::beginHelping() { HelpingThread::current().begin(); }
+
+void AsioDispatchService::endHelping() { HelpingThread::current().end(); }
+
+void AsioDispatchService::holdPool() { BatchedTurns::current().begin(); }
+
+void AsioDispatchService::wakePool() { BatchedTurns::current().end(); }
+
+void AsioDispatchService::finish(std::chrono::milliseconds limit) {
+  wakePool();  // what this thread still holds back
+  pool_->waitUntilIdle(std::chrono::steady_clock::now() + limit);
+}
+
+bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
+  const auto deadline = std::chrono::steady_clock::now() + limit;
+  std::vector<std::shared_ptr<OwnThreadQueue>> queues;
+  {
+    const MutexLock lock(mutex_);
+    isStopped_ = true;
+    queues = ownThreadQueues_;
+  }
+  for (const auto& queue : queues) queue->stop();
+  pool_->stop();
+  std::vector<std::string> stuck;
+  for (const auto& queue : queues) {
+    if (!queue->waitForEnd(deadline)) stuck.push_back(queue->label());
+  }
+  const bool hasPoolEnded = pool_->waitForEnd(deadline);
+  if (!hasPoolEnded || !stuck.empty()) {
+    std::ranges::move(pool_->labels().atWork(), std::back_inserter(stuck));
+    logStuck(stuck);
+    return false;
+  }
+  pool_->discardJobs();
+  const MutexLock lock(mutex_);
+  ownThreadQueues_.clear();
+  return true;
+}
+
+void AsioDispatchService::logStuck(const std::vector<std::string>& labels) {
+  std::string text = "jobs have not ended in time and are left behind, of the queues:";
+  for (const std::string& label : labels) text += " \"" + label + "\"";
+  if (labels.empty()) text += " the background queue";
+  log_.write(LogLevel::kError, detail::logPrefix("AsioDispatchService", __LINE__) + text);
+}
+
+// None when the system has no thread to give or the service has stopped: the caller's jobs then run
+// on the pool, or not at all.
+std::shared_ptr<DispatchQueue> AsioDispatchService::createOwnThreadQueue(std::string_view label,
+                                                                         QualityOfService quality) {
+  const MutexLock lock(mutex_);
+  if (isStopped_) return nullptr;
+  std::erase_if(ownThreadQueues_, [](const auto& queue) { return queue->hasEnded(); });
+  try {
+    auto queue = OwnThreadQueue::start(std::string(label), quality, runner_);
+    ownThreadQueues_.push_back(queue);
+    // What is handed out closes the queue when its last holder lets go; the queue itself stays here
+    // until its thread has ended, so that the thread never has to wait for itself.
+    DispatchQueue* const face = queue.get();
+    return {face, [queue = std::move(queue)](DispatchQueue*) { queue->close(); }};
+  } catch (const std::system_error& error) {
+    log_.write(LogLevel::kError, detail::logPrefix("AsioDispatchService", __LINE__) +
+                                     "no thread for queue " + std::string(label) +
+                                     ", it uses the pool: " + error.what());
+    return nullptr;
+  }
+}
+
+}  // namespace halvox::platform::linux_

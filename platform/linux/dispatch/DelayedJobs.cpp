@@ -1,0 +1,120 @@
+#include "platform/linux/dispatch/DelayedJobs.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <system_error>
+#include <utility>
+
+#include <asio/post.hpp>
+#include <sys/timerfd.h>
+#include <unistd.h>
+
+#include "platform/linux/dispatch/DispatchPool.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// Far below the end of the clock, which is some 292 years after the start of the machine.
+constexpr std::chrono::nanoseconds kLongestDelay = std::chrono::hours(24 * 3652);
+
+// Of the clock that std::chrono::steady_clock reads.
+int createTimer() {
+  const int timer = ::timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK);
+  if (timer < 0) throw std::system_error(errno, std::generic_category(), "timerfd_create");
+  return timer;
+}
+
+}  // namespace
+
+DelayedJobs::DelayedJobs(DispatchPool& pool)
+    : pool_(pool), timer_(pool.context(QualityOfService::kUtility), createTimer()) {
+  const MutexLock lock(mutex_);
+  awaitTimer();
+}
+
+DelayedJobs::Ticket DelayedJobs::add(std::chrono::nanoseconds delay, QualityOfService quality,
+                                     Job job) {
+  const Time due = std::chrono::steady_clock::now() +
+                   std::clamp(delay, std::chrono::nanoseconds(0), kLongestDelay);
+  const MutexLock lock(mutex_);
+  const Ticket ticket{due, added_++};
+  if (isStopped_) {
+    pool_.runner().countDiscarded(1);
+    return ticket;
+  }
+  jobs_.emplace(ticket, Delayed{quality, std::move(job)});
+  if (!armedFor_.has_value() || due < *armedFor_) arm();
+  return ticket;
+}
+
+void DelayedJobs::cancel(const Ticket& ticket) {
+  Delayed cancelled;  // goes when the lock is no longer held
+  const MutexLock lock(mutex_);
+  const auto place = jobs_.find(ticket);
+  if (place == jobs_.end()) return;
+  cancelled = std::move(place->second);
+  jobs_.erase(place);
+  if (jobs_.empty() || (armedFor_.has_value() && jobs_.begin()->first.first > *armedFor_)) arm();
+}
+
+void DelayedJobs::stop() {
+  std::map<Ticket, Delayed> discarded;
+  {
+    const MutexLock lock(mutex_);
+    isStopped_ = true;
+    discarded.swap(jobs_);
+    asio::error_code ignored;
+    timer_.cancel(ignored);
+  }
+  if (!discarded.empty()) pool_.runner().countDiscarded(discarded.size());
+}
+
+void DelayedJobs::arm() {
+  itimerspec when{};  // all zero: never
+  armedFor_.reset();
+  if (!jobs_.empty()) {
+    armedFor_ = jobs_.begin()->first.first;
+    const auto time = std::chrono::nanoseconds(armedFor_->time_since_epoch());
+    const auto seconds = std::chrono::floor<std::chrono::seconds>(time);
+    when.it_value.tv_sec = static_cast<time_t>(seconds.count());
+    when.it_value.tv_nsec = static_cast<long>((time - seconds).count());
+  }
+  ::timerfd_settime(timer_.native_handle(), TFD_TIMER_ABSTIME, &when, nullptr);
+}
+
+void DelayedJobs::awaitTimer() {
+  timer_.async_wait(asio::posix::stream_descriptor::wait_read,
+                    [this](const asio::error_code& error) {
+                      if (!error) onTimer();
+                    });
+}
+
+void DelayedJobs::onTimer() {
+  const MutexLock lock(mutex_);
+  if (isStopped_) return;
+  std::uint64_t expirations = 0;
+  // Nothing to read when the timer was set anew after it had gone off: then it will go off again.
+  if (::read(timer_.native_handle(), &expirations, sizeof(expirations)) > 0) {
+    const Time now = std::chrono::steady_clock::now();
+    while (!jobs_.empty() && jobs_.begin()->first.first <= now) {
+      auto node = jobs_.extract(jobs_.begin());
+      asio::post(pool_.context(node.mapped().quality),
+                 [this, job = std::move(node.mapped().job)] { runDue(job); });
+    }
+    arm();
+  }
+  awaitTimer();
+}
+
+void DelayedJobs::runDue(const Job& job) {
+  bool isStopped = false;
+  {
+    const MutexLock lock(mutex_);
+    isStopped = isStopped_;
+  }
+  if (isStopped) return pool_.runner().countDiscarded(1);
+  const JobRunner::Scope scope(nullptr, "delayed");
+  pool_.runner().run(job);
+}
+
+}  // namespace halvox::platform::linux_

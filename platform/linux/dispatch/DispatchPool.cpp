@@ -1,0 +1,65 @@
+#include "platform/linux/dispatch/DispatchPool.h"
+
+#include <system_error>
+#include <utility>
+
+namespace halvox::platform::linux_ {
+
+DispatchPool::DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService& statistics)
+    : runner_(std::move(runner)), labels_(statistics) {
+  if (!utility_.provide()) {
+    throw std::system_error(std::make_error_code(std::errc::resource_unavailable_try_again),
+                            "no threads for the queues");
+  }
+}
+
+DispatchPool::~DispatchPool() {
+  stop();
+  (void)waitForEnd(std::chrono::steady_clock::time_point::max());
+}
+
+// Threads for background work are made by those for utility work, which look after the timer; so
+// none begins with a lower priority than it should have.
+asio::io_context& DispatchPool::context(QualityOfService quality) {
+  switch (quality) {
+    case QualityOfService::kUserInteractive:
+      return (urgent_.provide() ? urgent_ : utility_).context();
+    case QualityOfService::kUtility:
+      break;
+    case QualityOfService::kBackground:
+      return (background_.provide() ? background_ : utility_).context();
+  }
+  return utility_.context();
+}
+
+void DispatchPool::waitUntilIdle(std::chrono::steady_clock::time_point deadline) {
+  isAwaited_.store(true);
+  const MutexLock lock(mutex_);
+  while (turns_.load() > 0 && idle_.waitUntil(mutex_, deadline)) {
+  }
+}
+
+void DispatchPool::tellIdle() {
+  const MutexLock lock(mutex_);
+  idle_.notifyAll();
+}
+
+void DispatchPool::stop() {
+  isStopped_.store(true, std::memory_order_relaxed);
+  waits_.stop();
+  delayedJobs_.stop();
+  for (PoolThreads* const threads : {&urgent_, &utility_, &background_}) threads->stop();
+}
+
+bool DispatchPool::waitForEnd(std::chrono::steady_clock::time_point deadline) {
+  return urgent_.waitForEnd(deadline) && utility_.waitForEnd(deadline) &&
+         background_.waitForEnd(deadline);
+}
+
+void DispatchPool::discardJobs() {
+  // Each handler sees the stop and lets its jobs go without running them.
+  for (PoolThreads* const threads : {&urgent_, &utility_, &background_}) threads->discardJobs();
+  waits_.discard();
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,28 @@
+#include "platform/linux/dispatch/JobRunner.h"
+
+#include <exception>
+#include <string>
+
+namespace halvox::platform::linux_ {
+
+JobRunner::JobRunner(LogService& log, StatisticsService& statistics)
+    : log_(log.createCategory("com.tarno.halvox", "dispatch")),
+      failed_(statistics.counter("dispatch", "jobs that failed")),
+      discarded_(statistics.counter("dispatch", "jobs discarded at the stop")) {}
+
+void JobRunner::reportFailure() noexcept {
+  failed_.add();
+  std::string what = "of an unknown kind";
+  try {
+    throw;
+  } catch (const std::exception& exception) {
+    what = exception.what();
+  } catch (...) {
+    // Nothing more is known about it.
+  }
+  log_.write(LogLevel::kError, detail::logPrefix("JobRunner", __LINE__) + "a job of queue \"" +
+                                   std::string(currentLabel_) +
+                                   "\" failed with an exception, the queue goes on: " + what);
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,85 @@
+#include "platform/linux/dispatch/PoolThreads.h"
+
+#include <system_error>
+
+#include "platform/linux/base/ThreadSetup.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+const char* threadName(QualityOfService quality) {
+  switch (quality) {
+    case QualityOfService::kUserInteractive:
+      return "pool-urgent";
+    case QualityOfService::kUtility:
+      return "pool-utility";
+    case QualityOfService::kBackground:
+      return "pool-background";
+  }
+  return "pool";
+}
+
+}  // namespace
+
+PoolThreads::~PoolThreads() {
+  stop();
+  join();
+}
+
+bool PoolThreads::provide() {
+  if (areThere_.load(std::memory_order_relaxed)) return true;
+  const MutexLock lock(mutex_);
+  if (isStopped_) return false;
+  try {
+    while (threads_.size() < kThreads) {
+      threads_.emplace_back(&PoolThreads::run, this);
+      ++running_;
+    }
+  } catch (const std::system_error&) {
+    if (threads_.empty()) return false;  // one alone will do
+  }
+  areThere_.store(true, std::memory_order_relaxed);
+  return true;
+}
+
+void PoolThreads::stop() {
+  const MutexLock lock(mutex_);
+  isStopped_ = true;
+  context_.stop();
+}
+
+bool PoolThreads::waitForEnd(std::chrono::steady_clock::time_point deadline) {
+  {
+    const MutexLock lock(mutex_);
+    while (running_ > 0) {
+      if (!ended_.waitUntil(mutex_, deadline) && running_ > 0) return false;
+    }
+  }
+  join();
+  return true;
+}
+
+void PoolThreads::join() {
+  std::vector<std::thread> threads;
+  {
+    const MutexLock lock(mutex_);
+    threads.swap(threads_);
+  }
+  for (std::thread& thread : threads) thread.join();
+}
+
+void PoolThreads::discardJobs() {
+  work_.reset();
+  context_.restart();
+  context_.poll();
+}
+
+void PoolThreads::run() {
+  setUpThread(threadName(quality_), quality_);
+  context_.run();
+  const MutexLock lock(mutex_);
+  --running_;
+  ended_.notifyAll();
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,125 @@
+#include "platform/linux/dispatch/SharedQueue.h"
+
+#include <stdexcept>
+#include <utility>
+
+#include <asio/post.hpp>
+
+#include "platform/linux/dispatch/BatchedTurns.h"
+#include "platform/linux/dispatch/DispatchPool.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// Shows a queue as being at work for a scope.
+class AtWork {
+ public:
+  explicit AtWork(QueueLabel& label) : label_(label) {
+    label_.atWork.fetch_add(1, std::memory_order_relaxed);
+  }
+  AtWork(const AtWork&) = delete;
+  AtWork& operator=(const AtWork&) = delete;
+  ~AtWork() { label_.atWork.fetch_sub(1, std::memory_order_relaxed); }
+
+ private:
+  QueueLabel& label_;
+};
+
+}  // namespace
+
+SharedQueue::SharedQueue(std::shared_ptr<DispatchPool> pool, std::string_view label,
+                         QualityOfService quality)
+    : pool_(std::move(pool)), label_(pool_->labels().label(label)), quality_(quality) {}
+
+void SharedQueue::async(JobWeight /*weight*/, Job job) {
+  if (pool_->isStopped()) return pool_->runner().countDiscarded(1);
+  {
+    const MutexLock lock(mutex_);
+    jobs_.push_back(std::move(job));
+    label_.added.add();
+    if (hasTurn_ || isWaiting_) return;
+    hasTurn_ = true;
+    pool_->beginTurn();
+  }
+  askForTurn();
+}
+
+void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
+                         std::optional<std::chrono::nanoseconds> timeout,
+                         std::function<void(WaitOutcome)> then) {
+  if (!isCurrent()) throw std::logic_error("a wait began outside the jobs of its queue");
+  auto shared = std::dynamic_pointer_cast<SharedSemaphore>(std::move(semaphore));
+  if (shared == nullptr) throw std::logic_error("a semaphore of another service");
+  {
+    const MutexLock lock(mutex_);
+    if (isWaiting_) throw std::logic_error("a job began a second wait");
+    isWaiting_ = true;
+  }
+  pool_->waits().begin(shared_from_this(), shared, timeout, std::move(then));
+}
+
+void SharedQueue::resume(Job then) {
+  {
+    const MutexLock lock(mutex_);
+    jobs_.push_front(std::move(then));
+    label_.added.add();
+    isWaiting_ = false;
+    // The job that began the wait may not have returned yet.
+    if (hasTurn_) return;
+    hasTurn_ = true;
+    pool_->beginTurn();
+  }
+  askForTurn();
+}
+
+void SharedQueue::askForTurn() {
+  BatchedTurns& turns = BatchedTurns::current();
+  if (turns.isActive()) return turns.note(shared_from_this());
+  beginTurn();
+}
+
+void SharedQueue::beginTurn() {
+  if (pool_->isStopped()) return discardJobs();
+  asio::post(pool_->context(quality_), [self = shared_from_this()] { self->runTurn(); });
+}
+
+void SharedQueue::runTurn() {
+  const JobRunner::Scope scope(this, label_.text);
+  const AtWork atWork(label_);
+  for (int ran = 0; ran < kJobsPerTurn; ++ran) {
+    if (pool_->isStopped()) return discardJobs();
+    if (!runNext()) return;
+  }
+  beginTurn();
+}
+
+// False when there is nothing to run; the turn has ended then.
+bool SharedQueue::runNext() {
+  Job job;
+  {
+    const MutexLock lock(mutex_);
+    if (isWaiting_ || jobs_.empty()) {
+      hasTurn_ = false;
+      pool_->endTurn();
+      return false;
+    }
+    job = std::move(jobs_.front());
+    jobs_.pop_front();
+  }
+  pool_->runner().run(job);
+  label_.run.add();
+  return true;
+}
+
+void SharedQueue::discardJobs() {
+  std::deque<Job> discarded;
+  {
+    const MutexLock lock(mutex_);
+    if (hasTurn_) pool_->endTurn();
+    hasTurn_ = false;
+    discarded.swap(jobs_);
+  }
+  if (!discarded.empty()) pool_->runner().countDiscarded(discarded.size());
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,82 @@
+#include <algorithm>
+#include <array>
+#include <charconv>
+#include <cstdint>
+#include <cstdlib>
+#include <string_view>
+#include <utility>
+
+#include <sys/stat.h>
+#include <syslog.h>
+
+#include "platform/linux/log/LogSink.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+int priority(LogLevel level) {
+  switch (level) {
+    case LogLevel::kDebug:
+      return LOG_DEBUG;
+    case LogLevel::kInfo:
+      return LOG_INFO;
+    case LogLevel::kDefault:
+      return LOG_NOTICE;
+    case LogLevel::kError:
+      return LOG_ERR;
+  }
+  return LOG_ERR;
+}
+
+// Sends each line as one entry of named fields. The journal takes entries into its socket's buffer,
+// so this waits only while journald itself stands still.
+class JournalLogSink final : public LogSink {
+ public:
+  explicit JournalLogSink(JournalSender sender) : sender_(std::move(sender)) {}
+
+  std::size_t write(std::span<const LogEntry> entries) override {
+    return static_cast<std::size_t>(
+        std::ranges::count_if(entries, [this](const LogEntry& entry) { return send(entry); }));
+  }
+  void finish() override {}
+
+ private:
+  bool send(const LogEntry& entry) {
+    std::array<std::string, 4> fields{
+        "MESSAGE=" + logLineText(entry),
+        "PRIORITY=" + std::to_string(priority(entry.level)),
+        "HALVOX_SUBSYSTEM=" + std::string(entry.subsystem),
+        "HALVOX_CATEGORY=" + std::string(entry.category),
+    };
+    std::array<iovec, fields.size()> vectors{};
+    std::ranges::transform(fields, vectors.begin(), [](std::string& field) {
+      return iovec{field.data(), field.size()};
+    });
+    return sender_(vectors.data(), static_cast<int>(vectors.size())) >= 0;
+  }
+
+  const JournalSender sender_;
+};
+
+}  // namespace
+
+std::unique_ptr<LogSink> makeJournalLogSink(JournalSender sender) {
+  return std::make_unique<JournalLogSink>(std::move(sender));
+}
+
+bool isJournalStream(int descriptor) {
+  const char* variable = std::getenv("JOURNAL_STREAM");
+  if (variable == nullptr) return false;
+  const std::string_view text(variable);
+  const char* const end = text.data() + text.size();
+  std::uint64_t device = 0;
+  std::uint64_t inode = 0;
+  const auto first = std::from_chars(text.data(), end, device);
+  if (first.ec != std::errc{} || first.ptr == end || *first.ptr != ':') return false;
+  const auto second = std::from_chars(first.ptr + 1, end, inode);
+  if (second.ec != std::errc{} || second.ptr != end) return false;
+  struct stat status {};
+  return ::fstat(descriptor, &status) == 0 && status.st_dev == device && status.st_ino == inode;
+}
+
+}  // namespace halvox::platform::linux_

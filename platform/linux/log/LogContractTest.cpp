@@ -1,0 +1,38 @@
+#include "platform/fake/contracts/LogContract.h"
+
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/testing/MemoryLogSink.h"
+#include "platform/linux/runtime/CounterStatisticsService.h"
+
+namespace halvox::platform::contract {
+
+namespace adapters {
+
+class SpdlogHarness {
+ public:
+  explicit SpdlogHarness(LogLevel threshold) {
+    auto sink = std::make_unique<linux_::MemoryLogSink>();
+    sink_ = sink.get();
+    service_ = std::make_unique<linux_::SpdlogLogService>(threshold, std::move(sink), statistics_);
+  }
+  LogService& service() { return *service_; }
+  std::vector<std::string> lines() {
+    service_->stop();
+    return sink_->lines();
+  }
+
+ private:
+  linux_::CounterStatisticsService statistics_;
+  linux_::MemoryLogSink* sink_ = nullptr;
+  std::unique_ptr<linux_::SpdlogLogService> service_;
+};
+
+}  // namespace adapters
+
+INSTANTIATE_TYPED_TEST_SUITE_P(Spdlog, LogContract, adapters::SpdlogHarness);
+
+}  // namespace halvox::platform::contract

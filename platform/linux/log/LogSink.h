@@ -1,0 +1,61 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <span>
+#include <string>
+#include <string_view>
+
+#include <sys/uio.h>
+
+#include "platform/linux/log/LogQueue.h"
+
+namespace halvox::platform::linux_ {
+
+// Longest line that a sink is given; the rest is told in numbers.
+inline constexpr std::size_t kLongestLogLine = 8192;
+
+// Takes lines from the thread that writes the log.
+class LogSink {
+ public:
+  virtual ~LogSink() = default;
+  // Writes the lines in order and returns how many of them reached the reader. May wait for the
+  // reader until finish() is called from another thread, and about a second after that.
+  virtual std::size_t write(std::span<const LogEntry> entries) = 0;
+  virtual void finish() = 0;
+};
+
+// The line of an entry: escaped, so that it is one line, and bounded.
+std::string logLineText(const LogEntry& entry);
+
+// Entries as lines of text, each with its end:
+//   2024-05-01T12:00:00.123+02:00 error [com.tarno.halvox:hvrs] the line
+// Belongs to one thread.
+class LogLineFormatter {
+ public:
+  LogLineFormatter();
+  ~LogLineFormatter();
+  LogLineFormatter(const LogLineFormatter&) = delete;
+  LogLineFormatter& operator=(const LogLineFormatter&) = delete;
+
+  // Valid until the next call.
+  [[nodiscard]] std::string_view format(const LogEntry& entry);
+
+ private:
+  struct Parts;
+  const std::unique_ptr<Parts> parts_;
+};
+
+// Lines of text on a descriptor, which is not owned.
+std::unique_ptr<LogSink> makeTextLogSink(int descriptor);
+
+// What sends fields to the journal: sd_journal_sendv, or what stands for it in a test.
+using JournalSender = std::function<int(const iovec* fields, int count)>;
+
+// Native journal entries. A line that the journal does not take counts as not written.
+std::unique_ptr<LogSink> makeJournalLogSink(JournalSender sender);
+
+// True when $JOURNAL_STREAM says that what is written to that descriptor goes to the journal.
+bool isJournalStream(int descriptor);
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,119 @@
+#include "platform/linux/log/SpdlogLogService.h"
+
+#include <algorithm>
+#include <vector>
+
+#include <systemd/sd-journal.h>
+#include <unistd.h>
+
+#include "platform/linux/base/ThreadSetup.h"
+
+namespace halvox::platform::linux_ {
+
+// One category's face of the service.
+class SpdlogLogService::Category final : public LogCategory {
+ public:
+  Category(SpdlogLogService& service, std::string subsystem, std::string category)
+      : LogCategory(std::min(service.levels_.written,
+                             service.levels_.kept.value_or(service.levels_.written))),
+        service_(service),
+        subsystem_(std::move(subsystem)),
+        category_(std::move(category)) {}
+
+  void write(LogLevel level, std::string_view line) override {
+    LogEntry entry{.time = std::chrono::system_clock::now(),
+                   .level = level,
+                   .subsystem = subsystem_,
+                   .category = category_,
+                   .text = {},
+                   .wholeLength = line.size()};
+    const std::string_view start = line.substr(0, kLongestLogLine);
+    if (service_.levels_.kept.has_value() && level >= *service_.levels_.kept) {
+      service_.memory_->add(entry, start);
+    }
+    if (level < service_.levels_.written) return;
+    entry.text = start;
+    service_.add(std::move(entry));
+  }
+
+ private:
+  SpdlogLogService& service_;
+  const std::string subsystem_;
+  const std::string category_;
+};
+
+SpdlogLogService::SpdlogLogService(Levels levels, std::unique_ptr<LogSink> sink,
+                                   StatisticsService& statistics)
+    : levels_(levels),
+      memory_(levels.kept.has_value() ? std::make_unique<LogMemory>(*levels.kept) : nullptr),
+      sink_(std::move(sink)),
+      received_(statistics.counter("log", "received")),
+      written_(statistics.counter("log", "delivered")),
+      dropped_(statistics.counter("log", "dropped: reader too slow")),
+      failed_(statistics.counter("log", "dropped: not taken by the reader")),
+      thread_(&SpdlogLogService::run, this) {}
+
+std::unique_ptr<SpdlogLogService> SpdlogLogService::onStandardError(Levels levels,
+                                                                    StatisticsService& statistics) {
+  std::unique_ptr<LogSink> sink = isJournalStream(STDERR_FILENO)
+                                      ? makeJournalLogSink(::sd_journal_sendv)
+                                      : makeTextLogSink(STDERR_FILENO);
+  return std::make_unique<SpdlogLogService>(levels, std::move(sink), statistics);
+}
+
+SpdlogLogService::~SpdlogLogService() { stop(); }
+
+LogCategory& SpdlogLogService::createCategory(std::string_view subsystem,
+                                              std::string_view category) {
+  std::pair<std::string, std::string> names(subsystem, category);
+  const MutexLock lock(mutex_);
+  std::unique_ptr<Category>& slot = categories_[names];
+  if (slot == nullptr) slot = std::make_unique<Category>(*this, names.first, names.second);
+  return *slot;
+}
+
+void SpdlogLogService::stop() {
+  queue_.end();
+  sink_->finish();
+  if (thread_.joinable()) thread_.join();
+}
+
+LogMemory::Contents SpdlogLogService::keptLines() const {
+  return memory_ == nullptr ? LogMemory::Contents{} : memory_->contents();
+}
+
+void SpdlogLogService::add(LogEntry entry) {
+  received_.add();
+  if (queue_.add(std::move(entry))) return;
+  dropped_.add();
+  unreported_.fetch_add(1, std::memory_order_relaxed);
+}
+
+void SpdlogLogService::run() {
+  setUpThread("log");
+  std::vector<LogEntry> entries;
+  while (queue_.take(entries)) {
+    const std::size_t written = sink_->write(entries);
+    written_.add(written);
+    failed_.add(entries.size() - written);
+    reportLosses();
+  }
+}
+
+// Not counted as received: the log says this of itself.
+void SpdlogLogService::reportLosses() {
+  const std::uint64_t lost = unreported_.exchange(0, std::memory_order_relaxed);
+  if (lost == 0) return;
+  std::string text = detail::logPrefix("SpdlogLogService", __LINE__) + std::to_string(lost) +
+                     " lines were dropped: the log is read too slowly";
+  const std::size_t length = text.size();
+  const LogEntry entry{.time = std::chrono::system_clock::now(),
+                       .level = LogLevel::kError,
+                       .subsystem = "com.tarno.halvox",
+                       .category = "log",
+                       .text = std::move(text),
+                       .wholeLength = length};
+  sink_->write({&entry, 1});
+}
+
+}  // namespace halvox::platform::linux_

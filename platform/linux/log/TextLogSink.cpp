@@ -1,0 +1,167 @@
+#include <algorithm>
+#include <array>
+#include <atomic>
+#include <cerrno>
+#include <chrono>
+#include <cstdint>
+#include <memory>
+#include <optional>
+
+#include <poll.h>
+#include <spdlog/pattern_formatter.h>
+#include <sys/eventfd.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/base/Utf8.h"
+#include "platform/linux/log/LogSink.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+// What a pipe takes without waiting once it is ready for writing.
+constexpr std::size_t kChunk = 4096;
+// How long lines may still wait for the reader when the log ends.
+constexpr std::chrono::milliseconds kLastWait{1000};
+
+std::string_view levelWord(spdlog::level::level_enum level) {
+  switch (level) {
+    case spdlog::level::debug:
+      return "debug";
+    case spdlog::level::info:
+      return "info";
+    case spdlog::level::err:
+      return "error";
+    default:
+      return "default";
+  }
+}
+
+spdlog::level::level_enum spdlogLevel(LogLevel level) {
+  switch (level) {
+    case LogLevel::kDebug:
+      return spdlog::level::debug;
+    case LogLevel::kInfo:
+      return spdlog::level::info;
+    case LogLevel::kDefault:
+      return spdlog::level::warn;
+    case LogLevel::kError:
+      return spdlog::level::err;
+  }
+  return spdlog::level::err;
+}
+
+// Our own words for the levels, which spdlog has no names for.
+class LevelFlag final : public spdlog::custom_flag_formatter {
+ public:
+  void format(const spdlog::details::log_msg& message, const std::tm& /*time*/,
+              spdlog::memory_buf_t& out) override {
+    const std::string_view word = levelWord(message.level);
+    out.append(word.data(), word.data() + word.size());
+  }
+  [[nodiscard]] std::unique_ptr<spdlog::custom_flag_formatter> clone() const override {
+    return std::make_unique<LevelFlag>();
+  }
+};
+
+// Waits for its reader without a time-out, so that an idle or a stuck log costs nothing; an event
+// descriptor ends the wait. Belongs to the log's thread but for finish().
+class TextLogSink final : public LogSink {
+ public:
+  explicit TextLogSink(int descriptor)
+      : descriptor_(descriptor), finish_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
+
+  std::size_t write(std::span<const LogEntry> entries) override;
+  void finish() override {
+    const std::uint64_t one = 1;
+    static_cast<void>(!::write(finish_.get(), &one, sizeof one));
+  }
+
+ private:
+  bool writeAll(std::string_view text);
+  bool waitForReader();
+
+  const int descriptor_;
+  const UniqueFd finish_;
+  LogLineFormatter formatter_;
+  std::optional<Clock::time_point> deadline_;  // once the end was asked for
+};
+
+std::size_t TextLogSink::write(std::span<const LogEntry> entries) {
+  std::size_t written = 0;
+  for (const LogEntry& entry : entries) {
+    if (writeAll(formatter_.format(entry))) ++written;
+  }
+  return written;
+}
+
+bool TextLogSink::writeAll(std::string_view text) {
+  while (!text.empty()) {
+    if (!waitForReader()) return false;
+    const ssize_t count = ::write(descriptor_, text.data(), std::min(text.size(), kChunk));
+    if (count < 0 && (errno == EINTR || errno == EAGAIN)) continue;
+    if (count < 0) return false;
+    text.remove_prefix(static_cast<std::size_t>(count));
+  }
+  return true;
+}
+
+bool TextLogSink::waitForReader() {
+  for (;;) {
+    std::array<pollfd, 2> polled{{{descriptor_, POLLOUT, 0}, {finish_.get(), POLLIN, 0}}};
+    int timeout = -1;
+    if (deadline_.has_value()) {
+      const auto left =
+          std::chrono::duration_cast<std::chrono::milliseconds>(*deadline_ - Clock::now());
+      timeout = static_cast<int>(std::max<std::int64_t>(left.count(), 0));
+      polled[1].fd = -1;
+    }
+    const int ready = ::poll(polled.data(), polled.size(), timeout);
+    if (ready < 0 && errno == EINTR) continue;
+    if (ready <= 0) return false;
+    if (polled[0].revents != 0) return true;  // an error shows when writing
+    deadline_ = Clock::now() + kLastWait;
+  }
+}
+
+}  // namespace
+
+struct LogLineFormatter::Parts {
+  Parts() { formatter.add_flag<LevelFlag>('*').set_pattern("%Y-%m-%dT%H:%M:%S.%e%z %* [%n] %v"); }
+
+  spdlog::pattern_formatter formatter;
+  spdlog::memory_buf_t line;
+};
+
+LogLineFormatter::LogLineFormatter() : parts_(std::make_unique<Parts>()) {}
+
+LogLineFormatter::~LogLineFormatter() = default;
+
+std::string_view LogLineFormatter::format(const LogEntry& entry) {
+  std::string name(entry.subsystem);
+  name += ':';
+  name += entry.category;
+  const std::string text = logLineText(entry);
+  parts_->line.clear();
+  parts_->formatter.format(
+      spdlog::details::log_msg(entry.time, {}, name, spdlogLevel(entry.level), text), parts_->line);
+  return {parts_->line.data(), parts_->line.size()};
+}
+
+std::string logLineText(const LogEntry& entry) {
+  std::string line;
+  const std::size_t taken = appendEscaped(line, entry.text, kLongestLogLine);
+  if (taken < entry.wholeLength) {
+    line += "… (" + std::to_string(entry.wholeLength - taken) + " bytes more)";
+  }
+  return line;
+}
+
+std::unique_ptr<LogSink> makeTextLogSink(int descriptor) {
+  return std::make_unique<TextLogSink>(descriptor);
+}
+
+}  // namespace halvox::platform::linux_
