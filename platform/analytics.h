@@ -8,20 +8,29 @@
 
 namespace halvox::platform {
 
-// Builds the payload of an event when somebody wants it. It must own all that it reads: it may be
-// called on another thread and after its maker has returned, or never.
+// Builds the payload of one event. The service calls it on a thread of its own, perhaps after the
+// sender has returned; for an event that is dropped it is never called. It must therefore own
+// everything that it reads: captures by reference would dangle.
 using AnalyticsPayloadBuilder = std::function<Dictionary()>;
 
-// Collects named events. Any thread may call.
+// Collects named events.
+//
+// Building and encoding a payload is expensive and not every event is collected. Hence the two
+// steps: a cheap question, then a builder that runs on another thread.
+//
+// Any thread may call. The composition root owns the service. A failure of storage does not come
+// back to the caller: the service counts the events that it drops, and logs them.
 class AnalyticsService {
  public:
   virtual ~AnalyticsService() = default;
 
-  // Whether anybody collects events of that name. Cheap: asked for every message.
+  // Whether anyone collects events of that name. It is asked for every message, so it must be
+  // cheap.
   [[nodiscard]] virtual bool isAnalyticsEventUsed(std::string_view eventName) = 0;
 
-  // Records one event, in the order of the calls of one thread. Never waits for storage to be
-  // written; when more events are pending than the service may hold it waits for room.
+  // Records one event. Events of one thread are recorded in the order of its calls. The call never
+  // waits for the disk. When more events are pending than the service may hold, it waits until
+  // there is room: slowing the sender keeps memory bounded without losing what it sent.
   virtual void sendAnalyticsEventLazy(std::string eventName, AnalyticsPayloadBuilder builder) = 0;
 };
 

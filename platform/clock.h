@@ -6,30 +6,34 @@
 
 namespace halvox::platform {
 
-// A point in time as people of one place write it.
+// A point in time as people in one time zone write it.
 struct LocalTime {
   int year = 1970;
   int month = 1;  // from 1
   int day = 1;    // from 1
   int hour = 0;
   int minute = 0;
-  int second = 0;                         // up to 60
-  std::chrono::minutes offsetFromUTC{0};  // what was added to UTC
+  int second = 0;                         // 60 in a leap second
+  std::chrono::minutes offsetFromUTC{0};  // local time minus UTC; positive east of Greenwich
   friend bool operator==(const LocalTime&, const LocalTime&) = default;
 };
 
-// The clocks of the platform. Any thread may ask; nothing blocks.
+// The clocks of the platform. Everything that depends on time asks here, so that tests can move it.
+//
+// Any thread may call; nothing blocks and nothing fails. The composition root owns the service.
 class ClockService {
  public:
   virtual ~ClockService() = default;
 
-  // The wall clock; it may be set back while the process runs.
+  // The wall clock. It can jump in both directions while the process runs; measure intervals with
+  // one of the uptimes.
   [[nodiscard]] virtual Date currentDate() const = 0;
-  // A date in the time zone of the platform; one that is beyond its calendar gives 1970.
+  // A date in the time zone of the platform. A date outside its calendar, or a NaN, gives the
+  // default LocalTime: dates come from clients, and a name made from one must not fail.
   [[nodiscard]] virtual LocalTime localTime(Date date) const = 0;
-  // Time since the system started.
+  // Seconds since the system started, suspended time included.
   [[nodiscard]] virtual std::chrono::duration<double> systemUptime() const = 0;
-  // Time that this process has run.
+  // Time since the kernel started this process, suspended time included.
   [[nodiscard]] virtual std::chrono::milliseconds processUptime() const = 0;
 };
 

@@ -14,131 +14,154 @@
 
 namespace halvox::platform {
 
-// An error that goes back to a client.
+// An error that is sent to a client. Domain and code identify it; the description is for people.
 struct Error {
   std::string domain{};
   std::int64_t code = 0;
   std::string description{};
-  // The error's name on the wire as it stands; when empty, the name is made of domain and code.
+  // The error's name on the wire. If it is empty, the name is made from the domain and the code.
   std::string name{};
   friend bool operator==(const Error&, const Error&) = default;
 };
 
-// Answers one request: an error, or the value that the method gives. Whoever holds it may call it
-// from any thread, at any time, or never; it never blocks and does nothing once the client is gone.
-// The wire has room for one answer: a second call is dropped and logged at debug level.
+// Answers one request with an error or with the value that the method returns.
+//
+// It may be called from any thread, at any time, or never. It does not block. It does nothing after
+// the client has disconnected. The wire has room for one answer: a second call is dropped and
+// logged at debug level.
 using ReplyCallback = std::function<void(const std::optional<Error>&, const Value&)>;
 
-// What a client's requests made the service hold on to: what its sessions keep, and messages that
-// wait, from the delivery of their request on. Read by the connection's thread before it delivers a
-// request.
+// What the service holds because of one client's requests: the content of its sessions, and
+// messages that wait in queues. A message counts from the delivery of its request on. The
+// connection's thread reads it before it delivers a request and compares it with the configured
+// limits.
 struct ResourceUse {
-  std::uint64_t bytes = 0;
+  std::uint64_t bytes = 0;  // on the heap
   std::uint64_t sessions = 0;
 };
 
-// The object behind a connection that the client's requests reach. The connection and the jobs that
-// it queued share it.
+// The object at this end of a connection, which a client's requests reach.
+//
+// Shared: the connection holds it until it is invalidated, and each job that it queued holds it
+// until the job has run.
 class ExportedObject {
  public:
   virtual ~ExportedObject() = default;
-  // What is held for this client now. Called on the connection's thread; never blocks.
+  // What the service holds for this client now. Called on the connection's thread; never blocks.
   [[nodiscard]] virtual ResourceUse resourceUse() const { return {}; }
 };
 
-// Held by the job that carries a request out; when the last copy goes, the request counts as
-// carried out, answered or not. A connection is read from only while few of its requests are open,
-// so a client cannot pile up work.
+// Stands for one request that has not been carried out. The job that carries the request out holds
+// it; when the last copy is destroyed, the request counts as carried out, whether it was answered
+// or not. A connection is read from only while few of its tokens exist. This is what keeps a client
+// from piling up work.
 using RequestToken = std::shared_ptr<void>;
 
-// One request as it came from the wire, decoded and of the method's signature.
+// One request, decoded and checked against the method's signature. The arguments belong to the
+// caller of `invoke` and are valid until it returns; copying a value is cheap.
 struct Invocation {
   std::span<const Value> arguments;
-  ReplyCallback reply;  // never empty; does nothing when the client wants no answer
+  ReplyCallback reply;  // never empty; does nothing if the client wants no answer
 };
 
-// Whether a request can make the service hold more. Such requests are refused while too many bytes
-// are held for the client; those that make a session also while it has too many of these.
+// Whether a request can make the service hold more for its client. While a client is over its limit
+// of bytes, requests that may hold more are refused and the others are not, so that the client can
+// always stop and destroy sessions. Requests that make a session are also refused while the client
+// has too many of these.
 enum class MethodEffect : std::uint8_t { kMayHoldMore, kHoldsNoMore, kMakesSession };
 
-// Who may make a request. The connection decides by what the system says about the other end; a
-// request that is not allowed is answered with org.freedesktop.DBus.Error.AccessDenied, and the
-// object never sees it. The owner is the user that the service runs as, and root.
+// Who may make a request: anyone who can connect, or only the owner, which is root or the user that
+// the service runs as. The connection decides by the credentials that the kernel or the bus has of
+// the other end, never by what a message says. It answers a request that is not allowed with
+// org.freedesktop.DBus.Error.AccessDenied; the object never sees it.
 enum class MethodAccess : std::uint8_t { kAnybody, kOwner };
 
-// One method of an interface: its name, the D-Bus signatures of what goes in and out, the function
-// that hands a request to the object, and who may ask. `invoke` runs on the connection's thread.
+// One method of an interface. `in` and `out` are D-Bus signatures. `invoke` hands a request to the
+// object; it runs on the connection's thread and must not block, because it would hold up every
+// client.
 struct InterfaceMethod {
   std::string_view name;
   std::string_view in;
   std::string_view out;
   MethodEffect effect = MethodEffect::kHoldsNoMore;
   void (*invoke)(ExportedObject& object, Invocation&& invocation) = nullptr;
-  // How many reporter IDs a request names; null for a method that takes no list of them. The
-  // connection layer refuses a request that names more than it is configured for.
+  // The number of reporter IDs that a request names; null for a method without a list of them. The
+  // connection layer refuses a request that names more than the configuration allows, because one
+  // small message could otherwise reach any number of sessions.
   std::size_t (*reporterIDs)(std::span<const Value> arguments) = nullptr;
   MethodAccess access = MethodAccess::kAnybody;
 };
 
-// A protocol that objects export. Made of constants; lives as long as the process.
+// A protocol that objects export. Made of constants; lives as long as the process. The name of the
+// type is part of the interface.
 struct NSXPCInterface {
   std::string_view name;
   std::string_view objectPath;
   std::span<const InterfaceMethod> methods;
 };
 
-// One client's connection. Handlers and requests come on the connection's thread, one at a time.
+// One client's connection.
+//
+//   made --resume--> open --> invalidated
+//                     └--> interrupted --> open or invalidated
+//
+// Shared by the service that made it and by whoever holds it for an answer. Handlers and requests
+// run on the connection's thread, one at a time. Whatever goes wrong on the wire ends in the
+// invalidation handler; no call here fails.
 class NSXPCConnection {
  public:
   virtual ~NSXPCConnection() = default;
 
-  // The process at the other end, as the kernel names it; never taken from a message.
+  // The process at the other end, as the kernel or the bus reports it; never taken from a message.
   [[nodiscard]] virtual ProcessID processIdentifier() const = 0;
-  // The connection in words, for the log.
+  // Names the connection in log lines.
   [[nodiscard]] virtual std::string description() const = 0;
 
-  // The following are set before resume().
+  // The following four are called before resume(), each at most once.
   virtual void setExportedInterface(const NSXPCInterface& interface) = 0;
   // The connection holds the object until it is invalidated.
   virtual void setExportedObject(std::shared_ptr<ExportedObject> object) = 0;
-  // Called when the other end is gone though the connection might come back.
+  // Called when the other end is gone but the connection might come back.
   virtual void setInterruptionHandler(std::function<void()> handler) = 0;
-  // Called once, last of all, when the connection has ended for good.
+  // Called once, after everything else, when the connection has ended for good.
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
-  // Starts delivery.
+  // Starts delivery. Requests arrive from the thread's next turn on, never inside this call.
   virtual void resume() = 0;
 };
 
-// Decides about new connections.
+// Decides which new connections are accepted. Implemented by the service; it must outlive the
+// listener.
 class NSXPCListenerDelegate {
  public:
   virtual ~NSXPCListenerDelegate() = default;
-  // Prepares and resumes a new connection; false refuses it. Runs on the connection's thread.
+  // Prepares and resumes a new connection, or returns false to refuse it. Runs on the connection's
+  // thread.
   virtual bool listenerShouldAcceptNewConnection(
       const std::shared_ptr<NSXPCConnection>& connection) = 0;
 };
 
-// The listener that the platform hands to the service.
+// The listener that the platform hands to the service. ConnectionService owns it.
 class NSXPCListener {
  public:
   virtual ~NSXPCListener() = default;
   // Does not own the delegate, which must outlive the listener.
   virtual void setDelegate(NSXPCListenerDelegate& delegate) = 0;
-  // Accepts and serves connections on the calling thread, for good. Returns only when the process
-  // was asked to end.
+  // Accepts and serves connections on the calling thread. It returns only after the process was
+  // asked to end; failures of accepting are logged and retried.
   virtual void resume() = 0;
 };
 
-// Where connections come from.
+// Where connections come from. The composition root owns the service.
 class ConnectionService {
  public:
   virtual ~ConnectionService() = default;
   // The process's own listener.
   virtual NSXPCListener& serviceListener() = 0;
-  // The connection whose request or handler is running on this thread, or null.
+  // The connection whose request or handler runs on this thread; null on every other thread. Valid
+  // until that request or handler returns.
   [[nodiscard]] virtual const NSXPCConnection* currentConnection() const = 0;
-  // The request that is being delivered on this thread, or null. Whoever queues its work keeps the
-  // token in the job.
+  // The token of the request that is being delivered on this thread; null on every other thread.
+  // Code that queues work for the request keeps the token in the job.
   [[nodiscard]] virtual RequestToken currentRequest() const = 0;
 };
 

@@ -7,12 +7,15 @@
 
 namespace halvox::platform {
 
-// Properties of the device that its maker set, such as "InternalBuild". Any thread may ask.
+// Properties that the maker of the device set, such as "InternalBuild". The Linux adapter takes
+// them from the configuration.
+//
+// Any thread may call; nothing blocks. The composition root owns the service.
 class DevicePropertyService {
  public:
   virtual ~DevicePropertyService() = default;
 
-  // The property's value, or none when the device has no such property.
+  // The value of a property, or none if the device does not have it.
   [[nodiscard]] virtual std::optional<Value> copyDeviceProperty(std::string_view key) const = 0;
 };
 

@@ -9,36 +9,42 @@
 
 namespace halvox::platform {
 
-// Asks the bug-capture service for diagnostics. Any thread may call; nothing blocks.
+// Asks the bug-capture service for diagnostics of one kind of problem.
+//
+// Any thread may call; nothing blocks. Shared by everyone who reports problems. A capture that
+// fails is reported in the reply.
 class AILDiagnosticReporter {
  public:
+  // `response` says where the capture is, or why there is none.
   using Reply = std::function<void(const Dictionary& response)>;
 
   virtual ~AILDiagnosticReporter() = default;
 
-  // What identifies a kind of problem. What is not known, or not given, is not in it.
+  // A dictionary that identifies one kind of problem. Arguments that are absent add no entry.
   [[nodiscard]] virtual Dictionary makeSignature(
       std::string_view domain, std::string_view type, std::string_view subType,
       std::string_view subtypeContext, std::optional<std::string_view> detectedProcess,
       const std::optional<Dictionary>& triggerThresholdValues) const = 0;
-  // Asks for a capture of diagnostics for the signature. The reply is called once, later, on a
-  // thread of the service, with what became of it.
+  // Asks for a capture for the signature. `durationSeconds`, `event` and `payload` describe the
+  // problem and are recorded with the capture. The reply is called exactly once, on a thread of the
+  // service, after this call has returned.
   virtual void requestSnapshot(const Dictionary& signature, double durationSeconds,
                                const std::optional<Dictionary>& event,
                                const std::optional<Dictionary>& payload, Reply reply) = 0;
 };
 
-// Where diagnostic reporters come from. Any thread may call.
+// Where diagnostic reporters come from. Any thread may call. The composition root owns the service.
 class DiagnosticReporterService {
  public:
-  // Asks for the state of the service as a dictionary; it is given to the callback, perhaps later
-  // and on another thread.
+  // Asks for the state of the service as a dictionary. The source passes it to the callback,
+  // perhaps later and on another thread: the service reads its state on its reporting queue.
   using StateSource = std::function<void(std::function<void(const Dictionary& state)>)>;
 
   virtual ~DiagnosticReporterService() = default;
 
   [[nodiscard]] virtual std::shared_ptr<AILDiagnosticReporter> createReporter() = 0;
-  // Who knows the service's own state, to be part of each capture. At most once, at the start.
+  // Installs the source of the service's own state, which becomes part of each capture. Called at
+  // most once, before the first client connects.
   virtual void setStateSource(StateSource source) = 0;
 };
 

@@ -9,64 +9,74 @@
 
 namespace halvox::platform {
 
+// A job must not throw: an adapter logs and counts the exception, and the queue goes on.
 using Job = std::function<void()>;
 
+// How urgent the work of a queue is. Clients wait for user-interactive work; nobody waits for
+// utility and background work, which therefore runs at a lower scheduling priority.
 enum class QualityOfService : std::uint8_t { kUserInteractive, kUtility, kBackground };
 
-// What a serial queue runs on: a thread of its own, or the pool that all shared queues use.
+// What a serial queue runs on: a thread of its own, or the pool that all shared queues use. An own
+// thread is for a queue that blocks or that must never wait for others.
 enum class QueueThreading : std::uint8_t { kOwnThread, kShared };
 
-// Whether a job can wait for anything (a file, a server, another queue). A brief one cannot, so a
-// thread that must not stand still may carry it out too.
+// Whether a job can block (on a file, a server or another queue). A brief job cannot, which allows
+// a thread that must not block, such as the I/O thread, to run it.
 enum class JobWeight : std::uint8_t { kBrief, kMayBlock };
 
-// Counts signals that wait to be consumed. Any thread may signal; a signal that nobody waits for
-// stays. Whoever holds it keeps it, and queues that wait on it keep it too.
+// Counts signals until they are consumed. Any thread may signal, and a signal without a waiter is
+// kept. Shared by those who signal and those who wait; a queue that waits on it also holds it.
 class DispatchSemaphore {
  public:
   virtual ~DispatchSemaphore() = default;
   virtual void signal() = 0;
-  // Blocks the calling thread until there is a signal, which is consumed; without a time limit.
-  // Only for what the system means to stand still; a queue's job waits with waitOn().
+  // Blocks the calling thread until there is a signal, and consumes it. There is no time limit.
+  // Only for a thread that is meant to stand still; a job of a queue uses waitOn(), which costs no
+  // thread.
   virtual void wait() = 0;
 };
 
 enum class WaitOutcome : std::uint8_t { kSignalled, kTimedOut };
 
-// Runs its jobs one at a time, in the order in which they came. Any thread may add jobs.
-// Jobs that are waiting when the process ends are not run.
+// Runs its jobs one at a time, in the order in which they were added. Any thread may add jobs.
+//
+// Shared by its users; jobs that were added keep it alive until they have run. Jobs that still wait
+// when the process ends are not run.
 class DispatchQueue {
  public:
   virtual ~DispatchQueue() = default;
 
-  // Adds a job and returns at once; the job never runs before this returns.
+  // Adds a job and returns at once. The job never runs inside this call, so the caller may hold a
+  // lock that the job takes.
   virtual void async(JobWeight weight, Job job) = 0;
-  // Waits on a semaphore of the same service without holding a thread. Called by a job of this
-  // queue, at most once and as the last thing it does: the queue runs no other job until there was
-  // a signal, which is consumed, or the time-out has passed (none: never). Then it runs `then`,
-  // before the jobs that wait; `then` is a job like any other and may wait again. For shared
-  // queues only.
+  // Waits on a semaphore of the same service without holding a thread. Only for jobs of shared
+  // queues: a job of this queue calls it at most once, as the last thing that it does. The queue
+  // runs no other job until there is a signal, which it consumes, or until the time-out has passed
+  // (none: it waits without limit). Then it runs `then` ahead of the jobs that wait. `then` is a
+  // job like any other and may wait again.
   virtual void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
                       std::optional<std::chrono::nanoseconds> timeout,
                       std::function<void(WaitOutcome)> then) = 0;
-  // True on the thread that is running a job of this queue right now.
+  // True on the thread that is running a job of this queue at the moment. For assertions.
   [[nodiscard]] virtual bool isCurrent() const = 0;
 };
 
 // Queues, delays and the background pool of the platform.
+//
+// Any thread may call. The composition root owns the service, which must outlive its queues.
 class DispatchService {
  public:
   virtual ~DispatchService() = default;
 
-  // A new serial queue; the label names its thread or its jobs for debuggers. Whoever holds it
-  // keeps it; jobs that were added keep it alive until they have run.
+  // A new serial queue. Debuggers, log lines and counters show the label. The caller shares the
+  // queue with its pending jobs.
   virtual std::shared_ptr<DispatchQueue> createSerialQueue(std::string_view label,
                                                            QualityOfService quality,
                                                            QueueThreading threading) = 0;
   // A new semaphore with that many signals in it.
   virtual std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals) = 0;
-  // Runs the job on the background-priority global queue after that delay, in no order with
-  // others. Costs no thread while it waits.
+  // Runs the job once after the delay, on the background pool, in no order with other jobs. A
+  // waiting job costs memory but no thread.
   virtual void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) = 0;
 };
 

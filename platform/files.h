@@ -11,30 +11,37 @@
 
 namespace halvox::platform {
 
-// One file of indented JSON text that comes into being piece by piece and appears under its name
-// complete or not at all. Belongs to one thread. Letting go of it before commit() leaves nothing.
+// One file of indented JSON text that is written piece by piece. It appears under its name when it
+// is complete, or not at all, so a reader never sees half a summary.
+//
+// The caller owns it and uses it on one thread. Destroying it before commit() removes what was
+// written. Writing in pieces saves a second copy of a large history in memory.
 class JsonArrayFile {
  public:
   virtual ~JsonArrayFile() = default;
 
-  // Adds one object to the array that the file holds: `{key: value}`. After an error the rest is
-  // ignored; commit() tells the error.
+  // Adds the object `{key: value}` to the array that the file holds. After the first failure
+  // further objects are ignored; commit() returns that failure.
   virtual void appendObject(std::string_view key, const Dictionary& value) = 0;
-  // Ends the array and gives the file its name; the path of the file, as it is in the file system.
+  // Ends the array and gives the file its name. Sets `path` to the file's path in the file system,
+  // or returns the first error and leaves no file.
   [[nodiscard]] virtual std::optional<Error> commit(std::string& path) = 0;
 };
 
-// Directories and files that the system leaves for people and other programs. Paths are the fixed
-// absolute ones of the system; the platform puts its storage root before them. Any thread may call;
-// everything here waits for the disk.
+// Directories and files that the service leaves for people and other programs. Paths are the fixed
+// absolute ones of the system; the platform puts its storage root in front of them.
+//
+// Any thread may call. Every call waits for the disk. The composition root owns the service.
 class FileService {
  public:
   virtual ~FileService() = default;
 
-  // Makes a directory with all its parents, with these permissions; one that exists is fine.
+  // Makes a directory and its missing parents with these permission bits. A directory that exists
+  // is not an error.
   [[nodiscard]] virtual std::optional<Error> createDirectory(std::string_view path,
                                                              std::uint32_t permissions) = 0;
-  // Begins a file in the directory. Never null: what is wrong shows at commit().
+  // Begins a file in the directory. Never null: an error shows at commit(), which the caller
+  // handles anyway.
   [[nodiscard]] virtual std::unique_ptr<JsonArrayFile> createJsonArrayFile(
       std::string_view directory, std::string_view name) = 0;
 };

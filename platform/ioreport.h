@@ -11,7 +11,8 @@
 
 namespace halvox::platform {
 
-// What a channel counts. A source may have formats of its own beyond these.
+// What a channel counts. The numbers are part of the interface. A source may send others; whoever
+// reads a channel must expect them.
 enum class IOReportFormat : std::uint8_t {
   kInvalid = 0,
   kSimple = 1,
@@ -20,10 +21,12 @@ enum class IOReportFormat : std::uint8_t {
   kSimpleArray = 4,
 };
 
-// What the value of a simple channel does: a counter only grows, until it is reset and begins at
-// zero again; a gauge goes up and down.
+// How the value of a simple channel changes. A counter only grows until it is reset, which begins
+// it at zero again. A gauge goes up and down. The difference of the two is computed differently
+// when the value falls.
 enum class IOReportKind : std::uint8_t { kGauge, kCounter };
 
+// Why an operation returned nothing.
 struct IOReportError {
   std::int64_t code = 0;
 };
@@ -31,24 +34,24 @@ struct IOReportError {
 // One state of a state channel.
 struct IOReportState {
   std::string_view name;
-  std::uint64_t inTransitions = 0;  // how often it was entered
-  std::uint64_t residency = 0;      // how long it held, in the channel's unit
-  double dutyCycle = 0;
+  std::uint64_t inTransitions = 0;  // how often the state was entered
+  std::uint64_t residency = 0;      // how long the state held, in the channel's unit
+  double dutyCycle = 0;             // this state's share of all residencies, 0 to 1
 };
 
-// The upper bound of a bucket that has none.
+// The upper bound of an open bucket, which counts everything from its lower bound on.
 inline constexpr std::int64_t kIOReportNoUpperBound = std::numeric_limits<std::int64_t>::max();
 
-// One bucket of a histogram channel: how often a value was from `lower` on and below `upper`.
+// One bucket of a histogram channel: how often a value was at least `lower` and less than `upper`.
 struct IOReportBucket {
   std::int64_t lower = 0;
   std::int64_t upper = 0;
   std::uint64_t hits = 0;
-  std::int32_t boundsResult = 0;  // not 0: the source cannot tell the bounds
+  std::int32_t boundsResult = 0;  // not 0 if the source does not know the bounds
 };
 
-// One channel as it is seen while samples are walked through. Refers to what the samples own: valid
-// only inside the callback. Only the values of its own format mean anything.
+// One channel during a walk through samples. The texts and spans refer to the samples and are valid
+// only inside the callback. Only the values of the channel's own format mean anything.
 struct IOReportChannel {
   IOReportFormat format = IOReportFormat::kInvalid;
   std::optional<std::string_view> driverName{};
@@ -63,7 +66,8 @@ struct IOReportChannel {
   std::int64_t maxValue = 0;                  // histogram
 };
 
-// What is known of one channel, read under the names of the driver reporting interface.
+// Accessors under the names of the driver reporting interface. An index must be less than the
+// count: callers walk from 0 to it.
 inline IOReportFormat IOReportChannelGetFormat(const IOReportChannel& channel) {
   return channel.format;
 }
@@ -107,7 +111,8 @@ inline double IOReportStateGetDutyCycle(const IOReportChannel& channel, std::int
 inline std::int32_t IOReportHistogramGetBucketCount(const IOReportChannel& channel) {
   return static_cast<std::int32_t>(channel.buckets.size());
 }
-// Sets the bounds and returns 0, or returns why the source cannot tell them and leaves them alone.
+// Sets the bounds and returns 0. If the source does not know them, returns its error and leaves the
+// bounds unchanged.
 inline std::int32_t IOReportHistogramGetBucketBounds(const IOReportChannel& channel,
                                                      std::int32_t index, std::int64_t& lower,
                                                      std::int64_t& upper) {
@@ -129,27 +134,31 @@ inline std::int64_t IOReportHistogramGetMaxValue(const IOReportChannel& channel)
   return channel.maxValue;
 }
 
-// A set of channels: which these were when the set was made. Immutable, shared.
+// A set of channels, fixed when the set was made. Immutable, shared.
 class IOReportChannels {
  public:
   virtual ~IOReportChannels() = default;
 };
 
-// What is sampled together. Shared by whoever samples it.
+// Channels that are sampled together. Shared by everyone who samples it.
 class IOReportSubscription {
  public:
   virtual ~IOReportSubscription() = default;
 };
 
-// The values of a subscription's channels at one moment, or their change between two. Immutable,
-// shared.
+// The values of a subscription's channels at one moment, or their change between two moments.
+// Immutable, shared. A session keeps the samples of its start until its stop.
 class IOReportSamples {
  public:
   virtual ~IOReportSamples() = default;
 };
 
-// One moment at which several subscriptions are sampled. Owned by its maker and used by one thread
-// at a time. Samples may outlive it; it must not outlive the service.
+// One moment at which several subscriptions are sampled. All samples of a moment come from the same
+// reading of the counters, because a reading for each of the eight groups of a report took eight
+// times as many reads.
+//
+// Its maker owns it and uses it on one thread at a time. Samples may outlive it. It must not
+// outlive the service.
 class IOReportMoment {
  public:
   IOReportMoment() = default;
@@ -158,12 +167,14 @@ class IOReportMoment {
   virtual ~IOReportMoment() = default;
 };
 
-// What the drivers count. Any thread may call. What comes back is null when there is nothing; then
-// `error` may tell why, and is left alone otherwise.
+// The counters of the drivers.
 //
-// A channel is the same in two samples when its names, format, unit, states and buckets are the
-// same and the driver did not withdraw it in between. A simple channel is a counter or a gauge, by
-// what the driver says of it, and that is part of what it is.
+// Any thread may call. The composition root owns the service. An operation that has nothing to
+// return returns null; it sets `error` if it knows why, and leaves it unchanged otherwise.
+//
+// A channel is the same in two samples if its names, format, kind, unit, states and bucket bounds
+// are equal and the driver did not withdraw it in between. Anything weaker would subtract counts of
+// different things.
 class IOReportService {
  public:
   using Channels = std::shared_ptr<const IOReportChannels>;
@@ -171,45 +182,50 @@ class IOReportService {
   using Samples = std::shared_ptr<const IOReportSamples>;
   using Moment = std::unique_ptr<IOReportMoment>;
   using Name = std::optional<std::string_view>;  // none: any
-  // Returns 0 to go on.
+  // Returns 0 to continue with the next channel.
   using Visitor = std::function<int(const IOReportChannel&)>;
 
   virtual ~IOReportService() = default;
 
-  // The channels that all drivers have now in that group and subgroup; null or an empty set when
+  // The channels that exist now in that group and subgroup, of all drivers. Null or an empty set if
   // there are none.
   virtual Channels IOReportCopyChannelsInGroup(Name group, Name subGroup,
                                                std::optional<IOReportError>& error) = 0;
   [[nodiscard]] virtual std::int32_t IOReportGetChannelCount(const Channels& channels) const = 0;
-  // Subscribes to the channels; sets which it subscribed, or null.
+  // Subscribes to the channels. Sets `subscribedChannels` to those that it subscribed to, or to
+  // null.
   virtual Subscription IOReportCreateSubscription(const Channels& channels,
                                                   Channels& subscribedChannels,
                                                   std::optional<IOReportError>& error) = 0;
-  // Never null. Reads nothing by itself.
+  // Never null. Reads no counter; the first sample of the moment does.
   [[nodiscard]] virtual Moment makeMoment() = 0;
-  // The values of those of the channels that there are. A channel that comes later than the set was
-  // made is not sampled; one of the set that goes and comes again, by its names and format, is.
-  // The first samples of a moment read the counters, and no reading is used that was begun before
-  // that call; all other samples of the moment are of the same reading. May take as long as the
-  // slowest source is allowed to.
+  // The current values of the channels in the set. A channel that appears after the set was made is
+  // not sampled. A channel of the set that disappears is left out, and is sampled again after a
+  // channel with its names and format has appeared.
+  // The first call for a moment reads the counters; it uses no reading that began before the call.
+  // Further calls for the same moment use that reading. May block until the slowest source has
+  // answered or its time limit has passed.
   virtual Samples IOReportCreateSamples(const Subscription& subscription, const Channels& channels,
                                         IOReportMoment& moment,
                                         std::optional<IOReportError>& error) = 0;
-  // What changed from the previous samples to the current ones, of the channels that are in both; a
-  // channel that is in one only is left out. The difference
-  //   of a gauge      is the current value less the previous one, at most what 64 bits hold;
-  //   of a counter    is that too, and, when it is lower than before, the current value: it was
-  //                   reset and has counted that since;
-  //   of a state      are those of its transitions and residencies; the duty cycle is the state's
-  //                   share of all residencies between the two;
-  //   of a histogram  are those of its hits; minimum and maximum are the lower bound of the lowest
-  //                   and the upper bound of the highest bucket with hits between the two, of an
-  //                   open bucket its lower bound.
-  // When one number of a state or histogram channel is lower than before, all of it was reset.
-  // Null without previous samples.
+  // What changed from the previous samples to the current ones. Only channels that are in both are
+  // in the result: what a new channel counted before its first sample is unknown. Null without
+  // previous samples.
+  //
+  // The difference
+  //   of a gauge      is the current value minus the previous one, limited to what 64 bits hold;
+  //   of a counter    is the same, unless the value fell: then the counter was reset, and the
+  //                   current value is what it has counted since;
+  //   of a state      is that of its transitions and residencies; the duty cycle is the state's
+  //                   share of all residencies between the two samples;
+  //   of a histogram  is that of its hits; minimum and maximum are the lower bound of the lowest
+  //                   and the upper bound of the highest bucket with new hits, or the lower bound
+  //                   of that bucket if it is open.
+  //
+  // If one number of a state or histogram channel fell, all of its numbers were reset.
   virtual Samples IOReportCreateSamplesDelta(const Samples& previous, const Samples& current,
                                              std::optional<IOReportError>& error) = 0;
-  // Shows the visitor each channel until it returns something else than 0.
+  // Passes each channel to the visitor until the visitor returns something other than 0.
   virtual void IOReportIterate(const Samples& samples, const Visitor& visitor) const = 0;
 };
 

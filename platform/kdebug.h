@@ -4,12 +4,15 @@
 
 namespace halvox::platform {
 
-// Trace points: marks in the system trace that cost next to nothing while nobody traces.
+// Trace points: marks in the system trace that cost next to nothing while nobody records them.
+//
+// Any thread may call. A mark that no tracer records is lost without a sign. The composition root
+// owns the service.
 class KdebugService {
  public:
   virtual ~KdebugService() = default;
 
-  // Emits one mark. May be called from any thread; never blocks.
+  // Emits one mark with four arguments. Never blocks. The spelling is part of the interface.
   virtual void kdebug_trace(std::uint32_t code, std::uint64_t argument1, std::uint64_t argument2,
                             std::uint64_t argument3, std::uint64_t argument4) = 0;
 };

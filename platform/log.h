@@ -12,24 +12,28 @@
 
 namespace halvox::platform {
 
-// The levels of the unified log, least important first.
+// The levels of the unified log, least important first; isEnabled() compares them in this order.
 enum class LogLevel : std::uint8_t { kDebug, kInfo, kDefault, kError };
 
-// One category of the log, made once and kept for the life of the process.
-// Any thread may use it. A disabled level costs a load and a branch.
+// One category of the log.
+//
+// The log service makes it once and keeps it for the life of the process, so callers keep a
+// reference. Any thread may use it. A disabled level costs a load and a branch; debug lines can
+// therefore stay on the hot path.
 class LogCategory {
  public:
   virtual ~LogCategory() = default;
   LogCategory(const LogCategory&) = delete;
   LogCategory& operator=(const LogCategory&) = delete;
 
-  // True when lines of that level are wanted by anybody.
+  // True if someone wants lines of that level.
   [[nodiscard]] bool isEnabled(LogLevel level) const {
-    // Orders with nothing: a level changed while running may be seen a little later.
+    // Orders with nothing: a change of the level may be seen a little later.
     return level >= threshold_.load(std::memory_order_relaxed);
   }
 
-  // Takes one line, its "%25s:%-5d " prefix included. Does not block on a slow reader of the log.
+  // Writes one line, which already has its "%25s:%-5d " prefix. Does not block on a slow reader of
+  // the log.
   virtual void write(LogLevel level, std::string_view line) = 0;
 
  protected:
@@ -37,13 +41,12 @@ class LogCategory {
   std::atomic<LogLevel> threshold_;
 };
 
-// The unified log of the platform.
+// The unified log of the platform. Any thread may call. The composition root owns the service.
 class LogService {
  public:
   virtual ~LogService() = default;
 
-  // The category of that name in that subsystem. Calling again with the same names gives the same
-  // category. The service owns it; it lives as long as the process.
+  // The category of that name in that subsystem. The same names always give the same category.
   virtual LogCategory& createCategory(std::string_view subsystem, std::string_view category) = 0;
 };
 
@@ -60,32 +63,36 @@ void appendLogPart(std::string& line, Number number) {
 inline void appendLogPart(std::string& line, bool flag) { line += flag ? '1' : '0'; }
 inline void appendLogPart(std::string& line, const Dictionary& value) { line += describe(value); }
 inline void appendLogPart(std::string& line, const Message& value) { line += describe(value); }
-// Anything that can say what it is; asked only when the line is written.
+// Anything with a description(). It is called only when the line is written.
 template <typename Described>
 requires requires(const Described& part) {
   { part.description() } -> std::convertible_to<std::string>;
 }
 void appendLogPart(std::string& line, const Described& part) { line += part.description(); }
 
-// The name right-aligned in 25 characters, a colon, the line left-aligned in 5, a blank.
+// The unit's name right-aligned in 25 characters, a colon, the line number left-aligned in 5, and a
+// space. Every log line of the system begins with it.
 std::string logPrefix(std::string_view unit, std::uint32_t line);
 
 }  // namespace detail
 
 // What one source unit logs with: its category and the name that its lines begin with.
-// A text and its parts are joined as they stand: kLog.info("found reporting session ", id).
-// Parts are texts, integers, values and objects with a description(); none is formatted unless the
-// line is wanted.
+//
+//   kLog.info("found reporting session ", id);
+//
+// The text and its parts are joined as they are. Parts are texts, integers, values, and objects
+// with a description(); none is formatted unless the line is wanted. Each unit has one as a
+// constant and uses it from any thread.
 class UnitLog {
  public:
   using CategoryAccessor = LogCategory& (*)();
   constexpr UnitLog(CategoryAccessor category, std::string_view unit)
       : category_(category), unit_(unit) {}
 
-  // The first part of a line, which also remembers where the line is logged.
+  // The first part of a line. It also carries the line number of the call.
   struct Text {
-    // The builtin is what std::source_location is made of, which clang 14 lacks.
-    // NOLINTNEXTLINE(google-explicit-constructor): so that call sites read as plain text
+    // std::source_location does the same, but the standard library of clang 14 does not have it.
+    // NOLINTNEXTLINE(google-explicit-constructor): call sites read as plain text
     Text(const char* first, std::uint32_t where = __builtin_LINE()) : text(first), line(where) {}
     const char* text;
     std::uint32_t line;

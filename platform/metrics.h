@@ -6,13 +6,17 @@
 
 namespace halvox::platform {
 
-// Collects structured metrics. Any thread may call.
+// Collects structured metrics in their protocol-buffers form.
+//
+// Any thread may call. A failure of storage does not come back to the caller: the service counts
+// what it drops, and logs it. The composition root owns the service.
 class MetricService {
  public:
   virtual ~MetricService() = default;
 
-  // Posts one metric: the message's encoded bytes under that identifier. Does not keep the message.
-  // Never waits for storage to be written; waits for room when more are pending than may be held.
+  // Records the message's encoded bytes under that identifier. Encodes before it returns and does
+  // not keep the message. Never waits for the disk; when more records are pending than the service
+  // may hold, it waits until there is room.
   virtual void postIssueMetric(std::uint32_t metricID, const ProtoBase& message) = 0;
 };
 

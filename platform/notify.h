@@ -9,21 +9,24 @@
 
 namespace halvox::platform {
 
-// Status 0 is success.
+// The result of a call: 0 is success. The caller logs anything else.
 using NotifyStatus = std::uint32_t;
 using NotifyToken = std::int32_t;
 
-// Notifications by name: somebody posts a name, and everybody who registered for it hears of it.
-// Any thread may call.
+// Notifications by name: a program posts a name, and everyone who registered for that name is
+// called. A post carries no data; the receiver reads the new state itself.
+//
+// Any thread may call. The composition root owns the service.
 class NotifyService {
  public:
   using Handler = std::function<void(NotifyToken)>;
 
   virtual ~NotifyService() = default;
 
-  // From now on the handler is called on the queue, with the token of this registration, after
-  // each post of that name, for the life of the process. Sets `token` and returns 0, or returns
-  // why not and leaves `token` alone.
+  // Registers a handler for the life of the process. It runs on the queue after a post of that
+  // name, with the token of this registration. Posts that come close together may become one call.
+  // Sets `token` and returns 0; on failure, such as a name that cannot exist, returns an error and
+  // leaves `token` unchanged.
   virtual NotifyStatus notify_register_dispatch(std::string_view name, NotifyToken& token,
                                                 std::shared_ptr<DispatchQueue> queue,
                                                 Handler handler) = 0;

@@ -9,50 +9,56 @@
 
 namespace halvox::platform {
 
-// What a performance trace records. Immutable, shared.
+// What a performance trace records. Immutable, shared by its sessions.
 class KQTraceConfig {
  public:
   virtual ~KQTraceConfig() = default;
 };
 
-// Hears how a performance trace goes on. Called on a thread of the service, never by a call to the
-// session before it has returned. A trace that was started ends in exactly one completion, with an
-// error when recording or saving failed; only one whose start failed never completes.
+// Receives the progress of a performance trace.
+//
+// Calls come on a thread of the service, never inside a call to the session. A trace that was
+// started ends in exactly one completion, with an error if recording or saving failed. A trace
+// whose start failed never completes.
 class KQTraceSessionDelegate {
  public:
   virtual ~KQTraceSessionDelegate() = default;
 
   virtual void kqTraceDidStart(const std::optional<Error>& error) = 0;
   virtual void kqTraceDidStop(const std::optional<Error>& error) = 0;
-  // Where the finished trace is; the token means nothing here.
+  // The finished trace is at `url`. The token has no meaning here.
   virtual void kqTraceDidComplete(const std::string& url, std::uint64_t token,
                                   const std::optional<Error>& error) = 0;
 };
 
 // One performance trace.
 //
-//   made --start--> recording --stop--> saved, its completion is heard
+//   made --start--> recording --stop--> saved, its completion is reported
 //        --start fails--> made
 //
-// Shared by whoever started it and by the service while it works on it. When nobody holds it any
-// more while it records, the recording ends and is dropped, and nothing is heard of it. A start
-// while it records and a stop while it does not do nothing. Any thread may call.
+// Shared by the code that started it and, while it works, by the service. If nobody else holds it
+// while it records, the recording ends, its data is deleted, and the delegate is not called.
+//
+// Any thread may call. A start during a recording does nothing, nor does a stop outside of one.
+// Every failure is reported to the delegate.
 class KQTraceSession {
  public:
   virtual ~KQTraceSession() = default;
 
-  // Keeps the delegate weakly; none ends the calls to it.
+  // Keeps the delegate weakly. None ends the calls: a trace that was replaced must not answer for
+  // its successor.
   virtual void setDelegate(std::weak_ptr<KQTraceSessionDelegate> delegate) = 0;
-  // Both return at once, whatever the tracer does, and are carried out in their order; the delegate
-  // hears the rest.
+  // Both return at once, whatever the tracer does, and are carried out in the order of the calls.
+  // The delegate learns how they ended.
   virtual void startKQTrace() = 0;
   virtual void stopKQTrace() = 0;
 };
 
-// Records and packages traces by itself. Any thread may call.
+// Records and packages traces by itself. Any thread may call. The composition root owns the
+// service. The spelling of the functions is part of the interface.
 class PerformanceTraceService {
  public:
-  // The standard template.
+  // The template for standard performance traces.
   static constexpr std::int32_t kStandardTemplate = 1;
 
   virtual ~PerformanceTraceService() = default;

@@ -8,14 +8,17 @@
 
 namespace halvox::platform {
 
-// Collects registered power events. Any thread may call.
+// Collects registered power events.
+//
+// Any thread may call. A failure of storage does not come back to the caller: the service counts
+// what it drops, and logs it. The composition root owns the service.
 class PowerLogService {
  public:
   virtual ~PowerLogService() = default;
 
-  // Records one event with its payload, and with the entries of `extra` under keys that the payload
-  // does not have. Never waits for storage to be written; waits for room when more are pending
-  // than may be held.
+  // Records one event: its payload, and the entries of `extra` whose keys the payload does not
+  // have. Never waits for the disk; when more records are pending than the service may hold, it
+  // waits until there is room.
   virtual void logPowerEvent(std::uint32_t categoryID, std::string_view eventName,
                              const Dictionary& payload, const std::optional<Dictionary>& extra) = 0;
 };

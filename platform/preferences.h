@@ -7,13 +7,18 @@
 
 namespace halvox::platform {
 
-// The settings store: values by key in domains of users. Read afresh at every call; a domain that
-// does not exist, cannot be read or has no such key gives none. Any thread may call; reads a file.
+// The settings store: values by key, in domains of users.
+//
+// Every call reads the store afresh, so no change can be missed and no cache has to be invalidated.
+// A domain that does not exist, a file that cannot be read and a missing key all give none.
+//
+// Any thread may call; a call reads a file. The composition root owns the service.
 class PreferenceService {
  public:
   virtual ~PreferenceService() = default;
 
-  // The value of a key in the domain of that application for that user, on any host.
+  // The value of a key in the domain of an application for a user, on any host. The spelling is
+  // part of the interface.
   [[nodiscard]] virtual std::optional<Value> CFPreferencesCopyValue(
       std::string_view key, std::string_view applicationID, std::string_view userName) const = 0;
   // The value of a key in a named suite of the user that the service runs for.

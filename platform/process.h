@@ -6,25 +6,30 @@
 
 namespace halvox::platform {
 
+// The kernel's process number. The kernel reuses it after the process has ended.
 using ProcessID = std::int32_t;
 
-// What the platform knows of a running process.
+// What the platform knows about a running process.
 struct ProcessRecord {
   ProcessID pid = 0;
-  // At most 15 bytes as the kernel has it; each byte that is not UTF-8 is replaced by U+FFFD.
+  // At most 15 bytes, as the kernel keeps it. Each byte that is not UTF-8 is replaced by U+FFFD,
+  // because the name becomes part of messages, whose texts are UTF-8.
   std::string commandName;
 };
 
-// Look-ups of processes. Any thread may ask; an answer reads a small file and does not wait.
+// Information about processes. Any thread may call; a call reads a small file and does not wait.
+// The composition root owns the service.
 class ProcessService {
  public:
   virtual ~ProcessService() = default;
 
-  // The record of a process, or none when there is no such process or it cannot be read.
+  // The record of a process, read at each call. None if there is no such process or it cannot be
+  // read.
   [[nodiscard]] virtual std::optional<ProcessRecord> processRecord(ProcessID pid) const = 0;
   [[nodiscard]] virtual ProcessID ownProcessIdentifier() const = 0;
   [[nodiscard]] virtual std::string ownProcessName() const = 0;
-  // Ends the process at once, without running destructors or flushing anything.
+  // Ends the process at once, without running destructors or flushing anything. Two rules of the
+  // service demand such an end.
   [[noreturn]] virtual void terminate(int exitStatus) = 0;
 };
 

@@ -9,18 +9,22 @@
 
 namespace halvox::platform {
 
-// Property-list files. Any thread may call; reading waits for the disk.
+// Reads property-list files. Clients name the files, so nothing in them is trusted.
+//
+// Any thread may call; reading waits for the disk. A failure sets `error`. The composition root
+// owns the service.
 class PropertyListService {
  public:
   virtual ~PropertyListService() = default;
 
   // The directory that relative paths start from.
   [[nodiscard]] virtual std::string currentDirectory() const = 0;
-  // The bytes of a file; none, with `error` set, when it cannot be read whole.
+  // The whole content of a file; none, with `error` set, if it cannot be read completely. Reading
+  // and parsing are two calls because the caller logs each failure by itself and continues.
   [[nodiscard]] virtual std::optional<Data> readFile(std::string_view path,
                                                      std::optional<Error>& error) const = 0;
-  // The root of a property list in XML or binary form; none, with `error` set, when the bytes are
-  // none or there are no bytes.
+  // The root of a property list in XML or binary form; none, with `error` set, if the bytes are not
+  // a property list or there are no bytes.
   [[nodiscard]] virtual std::optional<Value> parse(const std::optional<Data>& bytes,
                                                    std::optional<Error>& error) const = 0;
 };

@@ -7,9 +7,11 @@ namespace halvox::platform {
 namespace {
 
 constexpr unsigned kWireTypeBits = 3;
-constexpr unsigned kMaximumVarintBytes = 10;
+constexpr unsigned kMaximumVarintBytes = 10;  // 64 bits, seven to a byte
 constexpr unsigned kVarintBitsPerByte = 7;
 constexpr std::uint8_t kVarintContinues = 0x80;
+// Each level of a group is a level of recursion. Bytes can nest groups as deep as they are long,
+// and real messages have none.
 constexpr unsigned kMaximumGroupDepth = 100;
 
 void appendEscaped(std::string& text, char character) {
@@ -37,7 +39,7 @@ void appendEscaped(std::string& text, char character) {
     text += character;
     return;
   }
-  // Always three octal digits, so that a digit that follows is not taken for one of them.
+  // Always three octal digits: a digit that follows must not be read as part of the escape.
   text += '\\';
   for (const unsigned shift : {6U, 3U, 0U}) {
     text += static_cast<char>('0' + ((static_cast<unsigned>(byte) >> shift) & 7U));
@@ -68,6 +70,7 @@ std::uint64_t ProtoReader::readVarint() {
 }
 
 ProtoReader::Tag ProtoReader::readTag() {
+  // The field number is not checked: an unknown field is skipped whatever its number.
   const std::uint64_t tag = readVarint();
   return {tag >> kWireTypeBits, static_cast<ProtoWireType>(tag & 7U)};
 }
@@ -75,6 +78,7 @@ ProtoReader::Tag ProtoReader::readTag() {
 void ProtoReader::readString(std::string& value) {
   const std::uint64_t length = readVarint();
   if (error_) return;
+  // Compared before it is added: `position_ + length` could overflow.
   if (length > bytes_.size() - position_) {
     error_ = true;
     return;
@@ -115,7 +119,7 @@ bool ProtoReader::skipValue(std::uint64_t number, ProtoWireType wireType, unsign
     case ProtoWireType::kEndGroup:
       break;
   }
-  return fail();  // also for the two wire types that mean nothing
+  return fail();  // an end without a start, or one of the two wire types without a meaning
 }
 
 // NOLINTNEXTLINE(misc-no-recursion): the depth is bounded

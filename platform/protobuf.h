@@ -13,12 +13,12 @@ class ProtoReader;
 class ProtoWriter;
 class ProtoTextFormatter;
 
-// A message with a protocol-buffers form.
+// A message that can be encoded as protocol buffers. A plain value, used by one thread at a time.
 class ProtoBase {
  public:
   virtual ~ProtoBase() = default;
 
-  // Reads fields until the end; false after an error, with the fields before it read.
+  // Reads fields until the end. Returns false after an error; the fields before it have been read.
   [[nodiscard]] virtual bool readFrom(ProtoReader& reader) = 0;
   virtual void writeTo(ProtoWriter& writer) const = 0;
   virtual void formatText(ProtoTextFormatter& formatter, const char* name) const = 0;
@@ -29,7 +29,8 @@ class ProtoBase {
   ProtoBase& operator=(const ProtoBase&) = default;
 };
 
-// How a field's value is laid out, in the low three bits of its tag. Any number may come in.
+// How the value of a field is encoded: the low three bits of its tag. The bytes may also contain 6
+// and 7, which have no meaning; the reader treats them as errors.
 enum class ProtoWireType : std::uint8_t {
   kVarint = 0,
   kFixed64 = 1,
@@ -39,11 +40,13 @@ enum class ProtoWireType : std::uint8_t {
   kFixed32 = 5,
 };
 
-// A cursor over encoded bytes, which it does not own and which must outlive it. One thread.
-// Reading past the end sets the error flag, which stays set; nothing is ever read beyond the bytes.
+// A cursor over encoded bytes. It does not own them; they must outlive it. Used by one thread.
+//
+// The bytes are not trusted. Reading past the end sets the error flag, which stays set; nothing
+// beyond the bytes is ever read.
 class ProtoReader {
  public:
-  // The number is wider than any legal one, because it is what the bytes say.
+  // The number is wider than a legal one, because it is what the bytes say.
   struct Tag {
     std::uint64_t number;
     ProtoWireType wireType;
@@ -54,19 +57,21 @@ class ProtoReader {
   [[nodiscard]] std::size_t position() const { return position_; }
   [[nodiscard]] std::size_t end() const { return bytes_.size(); }
   [[nodiscard]] bool hasError() const { return error_; }
-  // Whether there is more to read: the end is not reached and nothing has failed.
+  // True while the end is not reached and nothing has failed.
   [[nodiscard]] bool hasMore() const { return position_ < end() && !error_; }
 
-  // The varint at the position. One that goes on after ten bytes reads as 0, without an error; one
-  // that is cut off by the end sets the error flag and reads as 0.
+  // The varint at the position. One that the end cuts off sets the error flag and reads as 0. One
+  // that continues after ten bytes, which is more than 64 bits need, reads as 0 without an error,
+  // and decoding continues after the ten bytes. The difference is required.
   [[nodiscard]] std::uint64_t readVarint();
   [[nodiscard]] Tag readTag();
-  // The string at the position, copied over `value`. Sets the error flag, and leaves `value` alone,
-  // when it is longer than what is left.
+  // Copies the string at the position to `value`. If the string is longer than the remaining bytes,
+  // sets the error flag and leaves `value` unchanged.
   void readString(std::string& value);
-  // Goes past the value of a field whose tag was read; a group is skipped to its end. False, and
-  // the error flag, when the value is cut off, its wire type is none that has a value, or groups
-  // are not closed by their own number or are nested more than 100 deep.
+  // Skips the value of a field whose tag was read; a group is skipped to its end. Returns false,
+  // and sets the error flag, if the value is cut off, its wire type has no value, a group is not
+  // closed by its own number, or groups are nested more than 100 deep. The depth is bounded because
+  // skipping recurses.
   [[nodiscard]] bool skipField(std::uint64_t number, ProtoWireType wireType);
 
  private:
@@ -80,15 +85,15 @@ class ProtoReader {
   bool error_ = false;
 };
 
-// Appends fields to a buffer of its own. One thread.
+// Appends fields to a buffer that it owns, in the order of the calls. Used by one thread.
 class ProtoWriter {
  public:
   void writeUInt64(std::uint64_t value, std::uint32_t number);
-  // A negative value takes ten bytes: it is written as its extension to 64 bits.
+  // A negative value takes ten bytes: the format extends it to 64 bits.
   void writeInt32(std::int32_t value, std::uint32_t number);
   void writeString(std::string_view value, std::uint32_t number);
 
-  // What was written so far; valid until the next write.
+  // The bytes written so far; valid until the next write.
   [[nodiscard]] std::span<const std::byte> bytes() const { return bytes_; }
 
  private:
@@ -98,17 +103,18 @@ class ProtoWriter {
   std::vector<std::byte> bytes_;
 };
 
-// Makes the text of messages as people read it, one value a line, objects in braces:
+// Formats messages as text for people, one value a line, with objects in braces:
 //
 //   report {
 //     duration: 12
 //     node: "mixer"
 //   }
 //
-// Strings are quoted; what is not printable ASCII in them is escaped. One thread.
+// Strings are quoted, and everything in them that is not printable ASCII is escaped. Used by one
+// thread.
 class ProtoTextFormatter {
  public:
-  // A null name gives an object without one. Every object that is begun is ended.
+  // A null name begins an object without a name. Each object that is begun must be ended.
   void beginObject(const char* name);
   void format(const char* name, std::int32_t value);
   void format(const char* name, std::uint64_t value);

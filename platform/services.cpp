@@ -7,6 +7,7 @@
 namespace halvox::platform {
 namespace {
 
+// A function's static instead of a global: static initialisers of other files may call it.
 std::optional<Services>& slot() {
   static std::optional<Services> services;
   return services;
@@ -14,6 +15,7 @@ std::optional<Services>& slot() {
 
 const Services& installed() {
   if (!slot().has_value()) {
+    // Not logged: the log is one of the services that are missing.
     std::fputs("halvox: a platform service was used before the services were installed\n", stderr);
     std::abort();
   }

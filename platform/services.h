@@ -25,8 +25,10 @@ class ResultsFileService;
 class StatisticsService;
 class TLMReportingService;
 
-// The platform services that the system asks for everything outside itself. Whoever makes the set
-// owns the services and keeps them until no other thread runs any more.
+// The platform services: everything outside itself that the system can ask for.
+//
+// The composition root (service/main.cpp, or the FakePlatform of a test) makes the services, owns
+// them, and destroys them after all other threads have ended. This struct only refers to them.
 struct Services {
   AnalyticsService& analytics;
   ClockService& clock;
@@ -52,11 +54,13 @@ struct Services {
   TLMReportingService& tlmReporting;
 };
 
-// Installs the services: once, before anything else, on the only thread. Tests install a new set
-// for each test while no other thread of theirs runs.
+// Installs the services: once, before anything else, while there is only one thread. Tests install
+// a new set for each test, at a moment when none of their other threads runs. Nothing is locked,
+// because these functions are called for every message.
 void installServices(const Services& services);
 
-// The installed services. Calling one before the installation ends the process.
+// The installed services. Any thread may call them after installServices(). A call before it is a
+// mistake of the program: it prints a line and aborts.
 AnalyticsService& analytics();
 ClockService& clock();
 ConnectionService& connections();

@@ -6,7 +6,7 @@
 
 namespace halvox::platform {
 
-// A count of one kind of thing that happened. Any thread may add.
+// Counts one kind of event. Any thread may add. The statistics service owns it.
 class Counter {
  public:
   void add(std::uint64_t count = 1) { value_.fetch_add(count, std::memory_order_relaxed); }
@@ -17,13 +17,17 @@ class Counter {
 };
 
 // The service's own bookkeeping: what was received, delivered, suppressed and dropped, by reason.
-// For each piece, received = delivered + suppressed + dropped.
+// For each piece, received = delivered + suppressed + dropped, so a loss that nobody counted shows
+// as a difference.
+//
+// Any thread may call. The composition root owns the service.
 class StatisticsService {
  public:
   virtual ~StatisticsService() = default;
 
-  // The counter of that piece and name, such as ("session", "suppressed: redundant"), made at the
-  // first call. The service owns it; it lives as long as the process, so callers keep it.
+  // The counter of that piece and name, such as ("session", "suppressed: redundant"). The first
+  // call makes it. It lives as long as the process, and callers keep the reference: looking a
+  // counter up costs more than adding to it.
   virtual Counter& counter(std::string_view piece, std::string_view name) = 0;
 };
 

@@ -12,7 +12,7 @@
 
 namespace halvox::platform {
 
-// Keys of the session info. A back-end that writes keys out writes these texts.
+// Keys of the session info. Their texts are part of the interface: a back-end writes them out.
 inline constexpr std::string_view kTLMReportingSessionInfoClientType =
     "TLMReportingSessionInfoClientType";
 inline constexpr std::string_view kTLMReportingSessionInfoClientVersion =
@@ -28,14 +28,14 @@ inline constexpr std::string_view kTLMReportingSessionInfoContainsRealtimeEvents
 inline constexpr std::string_view kTLMReportingSessionInfoClientBundleID =
     "TLMReportingSessionInfoClientBundleID";
 
-// Keys of the user info.
+// Keys of the user info. Their texts are part of the interface too.
 inline constexpr std::string_view kTLMReportingUserInfoClientName =
     "TLMReportingUserInfoClientName";
 inline constexpr std::string_view kTLMReportingUserInfoServiceName =
     "TLMReportingUserInfoServiceName";
 
-// The identity of an agent: one for each framework session, as the text that stands for it in the
-// session info. Immutable; shared by the session and the framework.
+// The identity of an agent, as a text in the session info. Each framework session has its own.
+// Immutable; shared by the session and the framework.
 class TLMSecureHierarchyToken {
  public:
   explicit TLMSecureHierarchyToken(std::string text) : text_(std::move(text)) {}
@@ -45,54 +45,55 @@ class TLMSecureHierarchyToken {
   const std::string text_;
 };
 
-// A session of the framework: what its back-ends need to know of it. Made by the framework, held
-// by whoever asked for it; letting go of it ends it.
+// A session of the framework: what its back-ends need to know about it. The framework makes it; the
+// code that asked for it holds it, and ends it by letting go of it.
 class TLMReportingSession {
  public:
   virtual ~TLMReportingSession() = default;
-  // For log lines.
+  // Names the session in log lines.
   [[nodiscard]] virtual std::string description() const = 0;
 };
 
-// What became of a message that was given to the framework: taken, or not, with the reason when
-// there is one to tell.
+// Whether the framework took a message. If it did not, `error` may say why.
 struct TLMReportingOutcome {
   bool sent = false;
   std::optional<Error> error{};
 };
 
-// One message for the framework.
+// One message for the framework. It refers to the payload, which must live until the call returns.
 struct TLMReportingMessage {
   std::uint16_t category;
   std::uint16_t type;
   const Dictionary& payload;
 };
 
-// The real-time reporting framework: forwards messages to the servers that collect them. Any thread
-// may call; one session is used by one thread at a time. Nothing here waits for a server: what
-// takes its time ends in a callback, which must not wait either.
+// The real-time reporting framework: forwards messages to the servers that collect them.
+//
+// Any thread may call; one session is used by one thread at a time. No call waits for a server:
+// whatever takes time ends in a callback, which must not block either. The composition root owns
+// the service. The spelling of the functions is part of the interface.
 class TLMReportingService {
  public:
-  // The back-ends that were found, or none.
+  // The back-ends that were found; none if there are none.
   using BackendsCallback = std::function<void(const std::optional<Array>&)>;
   using Token = std::shared_ptr<const TLMSecureHierarchyToken>;
   using Session = std::shared_ptr<TLMReportingSession>;
 
   virtual ~TLMReportingService() = default;
 
-  // A new token, unlike any other; tokens have no parent here.
+  // A new token with a text that no other token has. Tokens have no parent here.
   virtual Token TLMHierarchyTokenCreate() = 0;
   virtual Session TLMReportingCreateSession(const Dictionary& sessionInfo,
                                             const Dictionary& userInfo) = 0;
   // Begins to look for back-ends and returns. The callback is called exactly once, on a thread of
-  // the framework's own: never from inside this call or on the queue of a caller's job. It may come
-  // before this has returned, and also when nobody holds the session any more. It must own what it
-  // uses.
+  // the framework: never inside this call, and never on the queue of the caller's job, which may be
+  // waiting for it. It may run before this call returns, and after everyone else has let go of the
+  // session. It must own what it uses.
   virtual void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) = 0;
   virtual TLMReportingOutcome TLMReportingSendMessage(const Session& session,
                                                       const TLMReportingMessage& message) = 0;
-  // Sends what the framework still holds for the session; `flushed` is called exactly once when
-  // that is done or given up, which may be before this returns.
+  // Sends what the framework still holds for the session. `flushed` is called exactly once, when
+  // that is done or given up; this may be before the call returns.
   virtual void TLMReportingFlushMessages(const Session& session, std::function<void()> flushed) = 0;
   // Sends one message outside any session.
   virtual TLMReportingOutcome TLMReportingSendOneMessage(const Dictionary& sessionInfo,

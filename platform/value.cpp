@@ -15,7 +15,8 @@ using detail::StringRep;
 
 namespace {
 
-// Constants by length, so that a text of a length that no constant has costs one look.
+// Constants by the length of their text. A text with a length that no constant has costs one look;
+// without the table every decoded string would be compared with every constant.
 constexpr std::size_t kMaxConstantLength = 64;
 using ConstantTable = std::array<StringConstant*, kMaxConstantLength + 1>;
 
@@ -24,16 +25,19 @@ ConstantTable& constantTable() {
   return table;
 }
 
-// 2^63 and 2^64, exact as doubles.
+// 2^63 and 2^64 are exact as doubles, while the largest integers below them are not: comparing with
+// those would round up and let a conversion overflow.
 constexpr double kTwoTo63 = 9223372036854775808.0;
 constexpr double kTwoTo64 = 18446744073709551616.0;
 
 bool equalIntegers(std::int64_t left, bool leftSigned, std::int64_t right, bool rightSigned) {
   if (left != right) return false;
-  // The same bits mean the same number unless one side reads them as negative.
+  // Equal bits mean equal numbers, unless one side reads them as negative.
   return leftSigned == rightSigned || left >= 0;
 }
 
+// Converts the double to the integer's type, never the reverse: an integer above 2^53 loses bits as
+// a double and would equal its neighbours.
 bool equalsDouble(std::int64_t bits, bool isSigned, double number) {
   if (isSigned) {
     return number >= -kTwoTo63 && number < kTwoTo63 && number == std::trunc(number) &&
@@ -43,7 +47,7 @@ bool equalsDouble(std::int64_t bits, bool isSigned, double number) {
          static_cast<std::uint64_t>(number) == static_cast<std::uint64_t>(bits);
 }
 
-// A NaN equals every NaN.
+// A NaN equals every NaN: values that print the same count as the same (see Value).
 bool equalDoubles(double left, double right) {
   return left == right || (std::isnan(left) && std::isnan(right));
 }
@@ -112,7 +116,8 @@ Value::Value(Dictionary dictionary) noexcept {
   setPayload(std::exchange(dictionary.rep_, nullptr));
 }
 
-// Every counted node starts with its reference count, and an empty container has no node.
+// Every counted node begins with its reference count, so the kind of node does not matter here. An
+// empty container has no node.
 void Value::retain() const noexcept {
   if (auto* references = payload<detail::ReferenceCount*>()) detail::retain(*references);
 }
@@ -171,6 +176,7 @@ void Value::setNumber(NumberKind kind, double number) noexcept {
   setNumber(kind, bits);
 }
 
+// Relies on the order of the tags.
 ValueKind Value::kind() const {
   const Tag current = tag();
   if (current == Tag::kNone) return ValueKind::kNone;
@@ -204,7 +210,7 @@ std::uint64_t Value::toUInt64() const {
   const NumberKind kind = numberKind();
   if (isFloating(kind)) {
     const auto number = payload<double>();
-    if (!(number > 0)) return 0;  // a NaN too
+    if (!(number > 0)) return 0;  // false for a NaN, too
     if (number >= kTwoTo64) return std::numeric_limits<std::uint64_t>::max();
     return static_cast<std::uint64_t>(number);
   }

@@ -17,16 +17,19 @@ namespace halvox::platform {
 class Array;
 class Dictionary;
 
-// A point in time; `secondsSince1970` counts from 1970-01-01 00:00 UTC.
+// A point in time: seconds since 1970-01-01 00:00 UTC. It comes from clients, so any double is
+// possible, NaN and infinities included.
 struct Date {
   double secondsSince1970 = 0;
   friend bool operator==(const Date&, const Date&) = default;
 };
 
 // A program constant whose identity is kept: a value made from a text that equals a constant is
-// that very constant, wherever the text came from, so clients in other processes can name it.
-// Make constants only with static storage and before the first thread starts, of 64 bytes at most
-// and of different texts.
+// that very constant, even if the text came from another process. This is how clients select things
+// that the service tests by identity.
+//
+// Make constants only with static storage and before the first thread starts: the table of
+// constants has no lock. At most 64 bytes, each with a different text.
 class StringConstant {
  public:
   explicit StringConstant(std::string_view text);
@@ -49,9 +52,12 @@ struct ArrayRep;
 struct DictionaryRep;
 }  // namespace detail
 
-// The key of a dictionary entry: an immutable text of which equal copies share one node.
-// The table of shared nodes is bounded, so that clients cannot grow it without end; a key that
-// finds no place in it works the same and owns its text. Any thread may make and copy keys.
+// The key of a dictionary entry: an immutable text. Equal keys share one node, which makes
+// comparing them a comparison of pointers.
+//
+// The table of shared nodes is bounded, because clients choose the keys. A key that finds no place
+// in the table works the same way but owns its text. Any thread may make and copy keys; one key
+// object belongs to one thread at a time.
 class Key {
  public:
   Key(std::string_view text);
@@ -65,14 +71,17 @@ class Key {
   }
   ~Key();
 
-  // Valid as long as a copy of this key lives.
+  // Valid while a copy of this key exists.
   [[nodiscard]] std::string_view text() const;
+  // Not secret: clients can make keys with equal hashes. See secretHash() for tables of client
+  // keys.
   [[nodiscard]] std::uint32_t hash() const;
-  // True when the text has a blank (U+0020); known without a scan.
+  // True if the text has a space (U+0020). Stored in the node, because every message asks for every
+  // key.
   [[nodiscard]] bool hasBlank() const;
-  // True when all equal keys share this key's node for the life of the process.
+  // True if all equal keys share this key's node for the life of the process.
   [[nodiscard]] bool isInterned() const;
-  // Bytes that this key alone keeps alive; 0 for an interned one.
+  // Bytes that this key alone keeps in memory; 0 for an interned key.
   [[nodiscard]] std::size_t memorySize() const;
 
   friend bool operator==(const Key& left, const Key& right);
@@ -81,7 +90,7 @@ class Key {
   detail::KeyNode* node_;
 };
 
-// An immutable run of bytes, shared by all its copies.
+// An immutable sequence of bytes, shared by all copies. Copies may be used by different threads.
 class Data {
  public:
   explicit Data(std::span<const std::byte> bytes);
@@ -93,7 +102,7 @@ class Data {
   }
   ~Data();
 
-  // Valid as long as a copy of this object lives.
+  // Valid while a copy of this object exists.
   [[nodiscard]] std::span<const std::byte> bytes() const;
 
   friend bool operator==(const Data& left, const Data& right);
@@ -104,7 +113,8 @@ class Data {
   detail::DataRep* rep_;
 };
 
-// What a number was when it was made. Comparison ignores it; encoders use it.
+// The type that a number was made from. Comparison ignores it; encoders use it to write the number
+// as it came.
 enum class NumberKind : std::uint8_t {
   kBool,
   kUInt8,
@@ -118,7 +128,7 @@ enum class NumberKind : std::uint8_t {
   kDouble,
 };
 
-// What a number can be made from.
+// The types that a number can be made from.
 template <typename Number>
 concept ArithmeticNumber = std::integral<Number> || std::floating_point<Number>;
 
@@ -126,19 +136,20 @@ enum class ValueKind : std::uint8_t { kNone, kNumber, kString, kDate, kData, kAr
 
 // One property-list value: a number, a string, a date, data, an array or a dictionary.
 //
-// Values are immutable and shared: copying costs at most one reference count, and short strings and
-// numbers live in the value itself. Distinct copies may be used by different threads at once; one
-// value object belongs to one thread at a time, like any other plain object.
+// Values are immutable and shared: a copy costs at most one increment of a reference count, and
+// numbers and short strings live in the value itself. Up to six consumers and a history hold the
+// same message, so sharing must be cheap and needs no lock. Different threads may use different
+// copies at once; one value object belongs to one thread at a time.
 //
-// Two values are equal when their contents are: numbers by value whatever their kind (1, 1.0 and
-// true are equal; a NaN equals every NaN, so that equal means interchangeable), dates by their
-// number, strings and data byte for byte, arrays element by element, dictionaries entry by entry in
-// any order.
+// Two values are equal if their contents are equal. Numbers compare by value, whatever type they
+// were made from: 1, 1.0 and true are equal. A NaN equals every NaN, so that a repeated message
+// with a NaN is recognised as a repetition. Dates compare by their number, strings and data byte
+// for byte, arrays element by element, and dictionaries entry by entry in any order.
 //
-// Strings are UTF-8; whoever makes a value from outside bytes checks that first.
+// Strings are UTF-8. Code that makes a value from outside bytes checks that first.
 class Value {
  public:
-  Value() noexcept = default;  // no value at all; equal only to another such
+  Value() noexcept = default;  // no value; equal only to another one of these
   template <ArithmeticNumber Number>
   Value(Number number) noexcept;
   Value(std::string_view text);
@@ -149,7 +160,7 @@ class Value {
   Value(Data data) noexcept;
   Value(Array array) noexcept;
   Value(Dictionary dictionary) noexcept;
-  // Copies, moves and ends are written here because every message goes through dozens of them.
+  // Copying, moving and destroying are inline because every message does dozens of each.
   Value(const Value& other) noexcept {
     std::memcpy(storage_, other.storage_, sizeof storage_);
     if (isCounted()) retain();
@@ -158,7 +169,8 @@ class Value {
     std::memcpy(storage_, other.storage_, sizeof storage_);
     other.setTag(Tag::kNone);
   }
-  // The new content is taken before the old one goes: `other` may be this value or live inside it.
+  // The new content is taken before the old one is released: `other` may be this value or be inside
+  // it.
   Value& operator=(const Value& other) noexcept {  // NOLINT(bugprone-unhandled-self-assignment)
     Value taken(other);
     std::swap(storage_, taken.storage_);
@@ -179,29 +191,30 @@ class Value {
   [[nodiscard]] bool isArray() const { return kind() == ValueKind::kArray; }
   [[nodiscard]] bool isDictionary() const { return kind() == ValueKind::kDictionary; }
 
-  // The kind of a number; only for numbers.
+  // Only for numbers.
   [[nodiscard]] NumberKind numberKind() const;
-  // A number read as the type asked for: fractions are cut off, what lies outside the type's range
-  // becomes its nearest end, a NaN becomes 0 as an integer. As a bool every number but 0 is true.
-  // Anything but a number gives 0.
+  // The number converted to the type: a fraction is cut off, a number outside the type's range
+  // becomes the nearest end of the range, and a NaN becomes 0 as an integer. As a bool every number
+  // but 0 is true. Anything that is not a number gives 0.
   [[nodiscard]] std::int64_t toInt64() const;
   [[nodiscard]] std::uint64_t toUInt64() const;
   [[nodiscard]] double toDouble() const;
   [[nodiscard]] bool toBool() const;
 
-  // The text of a string, empty for anything else. Points into this value: it is valid until this
-  // value is changed, moved from or destroyed.
+  // The text of a string; empty for anything else. It is part of this value: valid until the value
+  // is changed, moved from or destroyed.
   [[nodiscard]] std::string_view string() const;
-  // True when this string is that very constant (see StringConstant).
+  // True if this string is that very constant (see StringConstant).
   [[nodiscard]] bool isIdenticalTo(const StringConstant& constant) const;
 
-  // The content, or an empty one when the value is of another kind.
+  // The content; an empty one if the value is of another kind.
   [[nodiscard]] Date date() const;
   [[nodiscard]] Data data() const;
   [[nodiscard]] Array array() const;
   [[nodiscard]] Dictionary dictionary() const;
 
-  // Bytes on the heap that this value keeps alive, shared ones included, the value's own 16 not.
+  // Bytes on the heap that this value keeps in memory. Shared bytes count for every holder, which
+  // makes the sum an upper bound. The value's own 16 bytes do not count.
   [[nodiscard]] std::size_t memorySize() const;
 
   friend bool operator==(const Value& left, const Value& right);
@@ -223,7 +236,7 @@ class Value {
     kDate,
     kInlineString,
     kConstantString,
-    // From here on the payload is a counted reference.
+    // From here on the payload is a counted reference; isCounted() relies on the order.
     kSharedString,
     kData,
     kArray,
@@ -253,12 +266,13 @@ class Value {
   void setNumber(NumberKind kind, double number) noexcept;
   static bool equalNumbers(const Value& left, const Value& right);
 
-  // Byte 0 is the tag; a number, date or reference is in bytes 8 to 15; an inline string has its
-  // length in byte 1 and its text from byte 2 on.
+  // Byte 0 is the tag. A number, date or reference is in bytes 8 to 15. An inline string has its
+  // length in byte 1 and its text from byte 2 on. Sixteen bytes, because a dictionary entry has one
+  // and messages have dozens of entries.
   alignas(8) unsigned char storage_[16] = {};
 };
 
-// An immutable list of values, shared by all its copies.
+// An immutable list of values, shared by all copies. Copies may be used by different threads.
 class Array {
  public:
   Array() noexcept = default;
@@ -287,10 +301,15 @@ class Array {
   detail::ArrayRep* rep_ = nullptr;
 };
 
-// A dictionary from texts to values. Copies share their content until one of them is changed: the
-// change copies it first, so nobody sees another's change. Entries are enumerated in the order in
-// which their keys were first set. Finding is by identity of the interned key for a small
-// dictionary and by an index for a large one, so hostile sizes cost no more than their bytes.
+// A dictionary from texts to values.
+//
+// Copies share their content until one of them is changed; the change copies the content first, so
+// no holder sees the change of another. Different threads may use different copies at once; one
+// object belongs to one thread at a time.
+//
+// Entries are enumerated in the order in which their keys were first set. A small dictionary is
+// searched key by key, a large one by an index with a secret hash: a client that sends many keys,
+// or keys that collide, costs no more time than their bytes do.
 class Dictionary {
  public:
   struct Entry {
@@ -313,7 +332,8 @@ class Dictionary {
   [[nodiscard]] const Entry* begin() const;
   [[nodiscard]] const Entry* end() const { return begin() + size(); }
 
-  // The value under a key, or null. Points into this dictionary: valid until it is changed.
+  // The value under a key, or null. It is part of this dictionary: valid until the dictionary is
+  // changed or destroyed.
   [[nodiscard]] const Value* find(const Key& key) const;
   [[nodiscard]] const Value* find(std::string_view key) const;
   [[nodiscard]] const Value* find(const char* key) const { return find(std::string_view(key)); }
@@ -322,17 +342,17 @@ class Dictionary {
   }
   [[nodiscard]] bool contains(std::string_view key) const { return find(key) != nullptr; }
 
-  // Makes room for that many entries in all, so that setting them allocates no more.
+  // Makes room for that many entries in total, so that setting them allocates nothing more.
   void reserve(std::size_t entries);
-  // Sets the value under a key, in the place of an old one or at the end.
+  // Sets the value under a key. An existing key keeps its position; a new one goes to the end.
   void set(const Key& key, Value value);
-  // Removes the entry under a key; false when there was none.
+  // Removes the entry under a key; returns false if there was none.
   bool remove(const Key& key);
   // Sets every entry of `other`, in its order.
   void merge(const Dictionary& other);
 
   [[nodiscard]] bool isIdenticalTo(const Dictionary& other) const { return rep_ == other.rep_; }
-  // Bytes on the heap that this dictionary keeps alive, shared ones included.
+  // Bytes on the heap that this dictionary keeps in memory, shared ones included.
   [[nodiscard]] std::size_t memorySize() const;
 
   friend bool operator==(const Dictionary& left, const Dictionary& right);
@@ -344,12 +364,12 @@ class Dictionary {
   detail::DictionaryRep* rep_ = nullptr;
 };
 
-// A message as the components hand it on: there may be none at all.
+// A message as the components pass it on. It may be absent: a client can send none.
 using Message = std::optional<Dictionary>;
 
-// The text of a value as log lines show it: strings as they stand, numbers in their shortest
-// decimal form, containers in braces or parentheses with their parts, data as hexadecimal digits,
-// dates as UTC. "(null)" for no value.
+// The text of a value as log lines show it: strings as they are, numbers in their shortest decimal
+// form, containers in braces or parentheses, data as hexadecimal digits, dates in UTC, and "(null)"
+// for no value.
 std::string describe(const Value& value);
 std::string describe(const Dictionary& dictionary);
 std::string describe(const Message& message);

@@ -12,7 +12,7 @@ namespace {
 constexpr int kThreads = 4;
 constexpr int kRounds = 5'000;
 
-// Runs the same work on several threads at once and waits for all.
+// Runs the same work on several threads at once and waits for all of them.
 template <typename Work>
 void onSeveralThreads(const Work& work) {
   std::vector<std::jthread> threads;
@@ -58,7 +58,7 @@ TEST(ValueConcurrencyTest, AChangeThatNeedsNoCopySeesWhatOthersDidBefore) {
       ASSERT_EQ(*copy.find("a"), Value(1));
       copy = Dictionary();
     });
-    original.set("a", 2);  // alone or not, depending on the other thread
+    original.set("a", 2);  // shared or not, depending on the other thread
     ASSERT_EQ(*original.find("a"), Value(2));
   }
 }

@@ -36,10 +36,12 @@ std::string describeNumber(const Value& value) {
   return {};
 }
 
-// Years beyond these are not dates but mistakes; they are shown as seconds.
+// Dates outside these years are mistakes, and the calendar of std::chrono ends at 32767. They are
+// printed as seconds.
 constexpr double kEarliest = -62135596800.0;  // 0001-01-01
 constexpr double kLatest = 253402300799.0;    // 9999-12-31
 
+// Always UTC: a log line must mean the same on every machine.
 std::string describeDate(Date date) {
   using namespace std::chrono;
   const double whole = std::floor(date.secondsSince1970);

@@ -1,6 +1,10 @@
 #pragma once
 
-// The shared nodes behind values. Included by the sources of value.h only.
+// The shared nodes behind values. Only the sources of value.h include this header.
+//
+// Each node begins with its reference count, and its content follows the struct in the same block
+// of memory: one allocation for each node, and one cache miss less than with a pointer to the
+// content.
 
 #include <atomic>
 #include <cstdint>
@@ -14,23 +18,26 @@ namespace halvox::platform::detail {
 
 using ReferenceCount = std::atomic<std::uint32_t>;
 
+// Orders with nothing: the caller copies a reference that it has already.
 inline void retain(ReferenceCount& references) noexcept {
   references.fetch_add(1, std::memory_order_relaxed);
 }
 
-// True when the caller gave up the last reference and must destroy the node. Orders all use of the
-// node by other threads before its destruction.
+// Gives up one reference. True if it was the last one and the caller must destroy the node; all use
+// of the node by other threads happens before that. The load saves the costlier fetch_sub for a
+// node without other holders, which is the common case.
 inline bool releaseLast(ReferenceCount& references) noexcept {
   return references.load(std::memory_order_acquire) == 1 ||
          references.fetch_sub(1, std::memory_order_acq_rel) == 1;
 }
 
-// Memory for a node followed by a variable tail, with no second allocation for the tail.
+// Memory for a node and its content.
 template <typename Node>
 void* allocateNode(std::size_t tailBytes) {
   return ::operator new(sizeof(Node) + tailBytes);
 }
 
+// A key's text. `hash` and `blank` are computed once, when the node is made.
 struct KeyNode {
   ReferenceCount references;
   std::uint32_t hash;
@@ -42,6 +49,7 @@ struct KeyNode {
   [[nodiscard]] std::string_view view() { return {text(), length}; }
 };
 
+// A string that is too long to be in its value.
 struct StringRep {
   ReferenceCount references;
   std::uint32_t length;
@@ -56,6 +64,7 @@ struct DataRep {
   [[nodiscard]] std::byte* bytes() { return reinterpret_cast<std::byte*>(this + 1); }
 };
 
+// An array's values. An empty array has no node.
 struct ArrayRep {
   ReferenceCount references;
   std::uint32_t count;
@@ -63,21 +72,24 @@ struct ArrayRep {
   [[nodiscard]] Value* values() { return reinterpret_cast<Value*>(this + 1); }
 };
 
+// A dictionary's entries, in the order of setting. An empty dictionary has no node.
 struct DictionaryRep {
   ReferenceCount references;
   std::uint32_t count;
   std::uint32_t capacity;
-  std::uint32_t indexSize;  // a power of two, 0 while the dictionary is small
-  std::uint32_t* index;     // slots hold entry number + 1, 0 when free
+  std::uint32_t indexSize;  // a power of two; 0 while the dictionary is small
+  std::uint32_t* index;     // a slot holds the number of its entry plus 1; 0 if it is free
 
   [[nodiscard]] Dictionary::Entry* entries() {
     return reinterpret_cast<Dictionary::Entry*>(this + 1);
   }
 };
 
-// A hash that differs from process to process, for tables whose keys come from clients.
+// A hash with a secret that each process chooses for itself. For tables whose keys come from
+// clients: without the secret nobody can choose keys that collide.
 std::uint32_t secretHash(std::string_view text);
 
+// Each gives up one reference and destroys the node if it was the last. Null is allowed.
 void releaseData(DataRep* rep) noexcept;
 void releaseArray(ArrayRep* rep) noexcept;
 void releaseDictionary(DictionaryRep* rep) noexcept;

@@ -9,7 +9,8 @@ using detail::DictionaryRep;
 
 namespace {
 
-// Up to this many entries a walk over the keys is faster than an index.
+// Up to this number of entries, comparing all keys is faster than an index: interned keys compare
+// as pointers.
 constexpr std::uint32_t kMaxWithoutIndex = 16;
 constexpr std::uint32_t kFirstCapacity = 4;
 
@@ -20,7 +21,7 @@ DictionaryRep* allocateRep(std::size_t capacity) {
 
 void addToIndex(DictionaryRep& rep, std::uint32_t entry) {
   const std::uint32_t mask = rep.indexSize - 1;
-  // Not the key's own hash: a client can make keys that are alike in it.
+  // Not the key's own hash: a client can choose keys that collide in it.
   std::uint32_t slot = detail::secretHash(rep.entries()[entry].key.text()) & mask;
   while (rep.index[slot] != 0) slot = (slot + 1) & mask;
   rep.index[slot] = entry + 1;
@@ -31,6 +32,7 @@ void buildIndex(DictionaryRep& rep) {
   rep.index = nullptr;
   rep.indexSize = 0;
   if (rep.count <= kMaxWithoutIndex) return;
+  // At most half full, which keeps the sequences of occupied slots short.
   rep.indexSize = 64;
   while (rep.indexSize < 2 * rep.count) rep.indexSize *= 2;
   rep.index = new std::uint32_t[rep.indexSize]();
@@ -45,7 +47,7 @@ void noteAppended(DictionaryRep& rep) {
   }
 }
 
-// A copy of another's index, for entries that are in the same order.
+// Copies an index for a copy of its entries in the same order.
 void copyIndex(DictionaryRep& rep, const DictionaryRep& other) {
   if (other.indexSize == 0) return;
   rep.index = new std::uint32_t[other.indexSize];
@@ -114,8 +116,8 @@ const Value* Dictionary::find(std::string_view key) const {
   return entry == nullptr ? nullptr : &entry->value;
 }
 
-// Afterwards this dictionary alone holds its content and has a place for one more entry at least
-// when `entries` is more than it has.
+// Ensures that no other dictionary shares the content, and that there is room for `entries` entries
+// in total.
 void Dictionary::makeRoomFor(std::size_t entries) {
   if (rep_ == nullptr) {
     rep_ = allocateRep(std::max<std::size_t>(entries, kFirstCapacity));
@@ -123,7 +125,8 @@ void Dictionary::makeRoomFor(std::size_t entries) {
   }
   const bool alone = rep_->references.load(std::memory_order_acquire) == 1;
   if (alone && entries <= rep_->capacity) return;
-  // A copy that is changed once and then kept, as most are, gets just the room it needs.
+  // A shared dictionary is usually changed once and then kept, so its copy gets exactly the room
+  // that it needs. One that grows entry by entry grows by half.
   const std::size_t capacity =
       alone ? std::max<std::size_t>(entries, rep_->capacity + rep_->capacity / 2) : entries;
   DictionaryRep* grown = allocateRep(capacity);
@@ -175,7 +178,7 @@ void Dictionary::merge(const Dictionary& other) {
     *this = other;
     return;
   }
-  // Keeps the entries where they are if `other` is this one.
+  // This copy keeps the entries alive in case `other` is this dictionary.
   // NOLINTNEXTLINE(performance-unnecessary-copy-initialization)
   const Dictionary source = other;
   for (const Entry& entry : source) set(entry.key, entry.value);
@@ -192,7 +195,7 @@ std::size_t Dictionary::memorySize() const {
 bool operator==(const Dictionary& left, const Dictionary& right) {
   if (left.rep_ == right.rep_) return true;
   if (left.size() != right.size()) return false;
-  // Repeated messages have their keys in the same order, so the same place is tried first.
+  // Repeated messages have their keys in the same order, so the same position is tried first.
   const Dictionary::Entry* other = right.begin();
   for (const Dictionary::Entry& entry : left) {
     const Value* counterpart = other->key == entry.key ? &other->value : right.find(entry.key);

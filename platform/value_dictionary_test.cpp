@@ -21,7 +21,7 @@ std::vector<std::string> keysOf(const Dictionary& dictionary) {
   return keys;
 }
 
-// Keys "key 0" and so on, with their numbers.
+// A dictionary with the keys "key 0", "key 1" and so on, and their numbers as values.
 Dictionary numbered(int count) {
   Dictionary dictionary;
   for (int number = 0; number < count; ++number) {
@@ -213,7 +213,7 @@ TEST(DictionaryTest, BehavesAsAMapUnderRandomChanges) {
   std::mt19937 random(3);  // NOLINT(cert-msc51-cpp): the same values in every run
   Dictionary dictionary;
   std::map<std::string, int> model;
-  std::vector<Dictionary> holders;  // keep older states, so that changes have to copy
+  std::vector<Dictionary> holders;  // hold earlier states, so that changes have to copy
   for (int round = 0; round < 20'000; ++round) {
     const std::string key = std::to_string(random() % 60);
     if (random() % 3 == 0) {
@@ -233,9 +233,9 @@ TEST(DictionaryTest, BehavesAsAMapUnderRandomChanges) {
   }
 }
 
-// Texts of which all have the same std::hash: the first half is any, the second makes up for it.
-// The hash is MurmurHash64A with the seed of this standard library, all of whose steps but the last
-// can be undone.
+// Texts that all have the same std::hash: the first half is arbitrary, and the second half cancels
+// it. The hash is MurmurHash64A with the seed of this standard library. All of its steps but the
+// last can be inverted.
 std::string collidingKey(std::uint64_t number) {
   constexpr std::uint64_t kFactor = 0xc6a4a7935bd1e995U;
   constexpr std::uint64_t kInverse = 0x5f7a0ea7e59b19bdU;
@@ -274,7 +274,7 @@ TEST(DictionaryTest, KeysThatWereMadeToCollideCostAboutWhatOthersCost) {
       timeToFill([](std::uint64_t number) { return "ordinary " + std::to_string(number); });
   const auto colliding = timeToFill(collidingKey);
 
-  // A walk over all colliding keys for each of them would take some hundred times as long.
+  // Comparing each key with all colliding keys would take some hundred times as long.
   EXPECT_LT(colliding, 20 * ordinary);
 }
 

@@ -10,12 +10,13 @@ namespace {
 
 using detail::KeyNode;
 
-// Interned keys stay for the life of the process, so their number is bounded; real vocabularies
-// have some hundreds. Long texts are never worth it.
+// Interned keys are never freed, and clients choose them: their number must be bounded. Real
+// vocabularies have some hundreds of keys. Long texts are not worth a place.
 constexpr std::size_t kMaxInternedKeys = 4096;
 constexpr std::size_t kMaxInternedLength = 128;
-constexpr std::size_t kTableSlots = 4 * kMaxInternedKeys;
-// Texts that hash alike would make each look-up walk; past this many the text is not interned.
+constexpr std::size_t kTableSlots = 4 * kMaxInternedKeys;  // at most a quarter full
+// std::hash has no secret, so a client can choose texts that collide. After this many probes a text
+// is not interned, which bounds the cost of a look-up.
 constexpr std::size_t kMaxProbes = 16;
 
 KeyNode* makeNode(std::string_view text, std::uint32_t hash, bool interned) {
@@ -27,10 +28,11 @@ KeyNode* makeNode(std::string_view text, std::uint32_t hash, bool interned) {
   return node;
 }
 
-// Open addressing; slots are only ever filled, so readers need no lock.
+// The table of interned keys. Any thread may call. A slot that was filled never changes again; this
+// is why readers need no lock.
 class InternTable {
  public:
-  // The shared node of that text, made when there is room; null when there is none.
+  // The shared node of that text, which is made if there is room; null if there is none.
   KeyNode* intern(std::string_view text, std::uint32_t hash) {
     const Probe found = probe(text, hash);
     if (found.node != nullptr || found.freeSlot == nullptr) return found.node;
@@ -57,7 +59,7 @@ class InternTable {
   KeyNode* insert(std::string_view text, std::uint32_t hash) {
     const std::lock_guard lock(mutex_);
     if (count_ >= kMaxInternedKeys) return nullptr;
-    const Probe found = probe(text, hash);  // another thread may have been faster
+    const Probe found = probe(text, hash);  // another thread may have inserted it meanwhile
     if (found.node != nullptr || found.freeSlot == nullptr) return found.node;
     KeyNode* node = makeNode(text, hash, true);
     found.freeSlot->store(node, std::memory_order_release);
@@ -71,7 +73,7 @@ class InternTable {
 };
 
 InternTable& internTable() {
-  // Never destroyed: keys with static storage outlive everything.
+  // Never destroyed: keys with static storage live longer than any static of this file.
   static auto* table = new InternTable;
   return *table;
 }
@@ -111,6 +113,8 @@ std::size_t Key::memorySize() const {
 
 bool operator==(const Key& left, const Key& right) {
   if (left.node_ == right.node_) return true;
+  // Equal interned keys share a node. Two different nodes can hold equal texts only if at least one
+  // of them is not interned.
   if (left.node_->interned && right.node_->interned) return false;
   return left.node_->hash == right.node_->hash && left.text() == right.text();
 }

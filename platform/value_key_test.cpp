@@ -76,7 +76,8 @@ TEST(KeyTest, SelfAssignmentKeepsTheText) {
   EXPECT_EQ(key.text(), std::string(200, 'x'));
 }
 
-// The table is the process's, so it is filled in a process of its own. Exits with 0 when all holds.
+// The table belongs to the process, so it is filled in a child process. Exits with 0 if all checks
+// hold.
 [[noreturn]] void fillTheTable() {
   const Key early("early");
   std::size_t interned = 0;
@@ -89,7 +90,7 @@ TEST(KeyTest, SelfAssignmentKeepsTheText) {
   const Key lateAgain("late");
   const Dictionary dictionary{{late, 1}, {early, 2}};
   const std::vector<bool> facts = {
-      interned >= 2048 && interned <= 4096,  // bounded, yet useful
+      interned >= 2048 && interned <= 4096,  // bounded, but still useful
       !late.isInterned(),
       late == lateAgain && late != early,
       Key("early").isInterned() && Key("early") == early,

@@ -18,7 +18,7 @@ constexpr std::int64_t kTwoTo53 = std::int64_t{1} << 53;
 constexpr double kTwoTo63 = 9223372036854775808.0;
 constexpr double kTwoTo64 = 18446744073709551616.0;
 
-// Values of all kinds that hold that small number.
+// Values of all number kinds that hold that small number.
 std::vector<Value> inAllKinds(std::uint8_t number) {
   return {Value(number),
           Value(static_cast<std::int8_t>(number)),

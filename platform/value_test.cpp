@@ -23,7 +23,7 @@ constexpr std::string_view kSharedText = "fifteen bytes..";
 
 Data dataOf(std::string_view text) { return Data(std::as_bytes(std::span(text))); }
 
-// One value of every kind, with contents on the heap where a kind can have them.
+// One value of every kind, with contents on the heap if the kind can have them.
 std::vector<Value> oneOfEachKind() {
   return {Value(),
           Value(1),
@@ -217,7 +217,7 @@ TEST(ValueCopyTest, AValueCanTakeThePlaceOfWhatHoldsIt) {
   EXPECT_EQ(array, Value(kSharedText));
 
   Value dictionary(Dictionary{{"inner", Array{kSharedText}}});
-  const Value* inner = dictionary.dictionary().find("inner");  // lives in `dictionary`
+  const Value* inner = dictionary.dictionary().find("inner");  // is part of `dictionary`
   dictionary = *inner;
   EXPECT_EQ(dictionary, Value(Array{kSharedText}));
 }
