@@ -5,7 +5,8 @@
 
 namespace halvox {
 
-// What the sources of the driver statistics log with.
+// The log of all sources of the driver statistics. They share one unit name, because the name is
+// part of the log lines' interface.
 inline constexpr platform::UnitLog kDriverLog(&HVReportingDriverUtilityCategory,
                                               "HVReportingDriverUtility");
 

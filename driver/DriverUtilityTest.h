@@ -12,7 +12,7 @@
 #include "session/HVReportingSession.h"
 
 namespace halvox {
-// What tests of the sampler share.
+// Shared by the tests of the sampler.
 namespace driver_testing {
 
 using platform::Dictionary;
@@ -20,7 +20,7 @@ using platform::LogLevel;
 using Channel = platform::FakeIOReportService::Channel;
 using Texts = std::vector<std::string>;
 
-// The groups that there may be, in their order.
+// The descriptions of all groups, in the order of their reports.
 inline constexpr const char* kGroups[] = {"TarnoQ7AMP-(null)",
                                           "Speaker-(null)",
                                           "(null)-MCA",
@@ -37,7 +37,7 @@ inline Channel simpleChannel(std::string name, std::int64_t value) {
           .integerValue = value};
 }
 
-// With a session that is started, and no channels yet.
+// Has a session that is started, and no channels yet.
 class DriverUtilityTest : public testing::Test {
  protected:
   DriverUtilityTest() {
@@ -46,7 +46,7 @@ class DriverUtilityTest : public testing::Test {
     forgetWhatHappened();
   }
 
-  // A sampler of the groups that there are now, as the service makes it at its start.
+  // A sampler of the groups that exist now, as the service makes it when it starts.
   HVReportingDriverUtility makeUtility() {
     HVReportingDriverUtility utility;
     forgetWhatHappened();
@@ -57,7 +57,7 @@ class DriverUtilityTest : public testing::Test {
     platform_.log.clear();
     platform_.analytics.clear();
   }
-  // The lines of the driver statistics.
+  // The log lines of the driver statistics.
   Texts lines(LogLevel level) const {
     Texts texts;
     for (const auto& line : platform_.log.lines(level)) {

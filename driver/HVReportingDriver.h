@@ -6,16 +6,17 @@
 
 namespace halvox {
 
-// One channel group of the drivers to subscribe to. Immutable.
+// Names one group of driver channels to subscribe to. A plain value, immutable.
 class HVReportingDriver {
  public:
-  // An absent name means any.
+  // An absent name matches any.
   static HVReportingDriver driverWithGroupName(std::optional<std::string_view> groupName,
                                                std::optional<std::string_view> subGroupName);
 
   [[nodiscard]] const std::optional<std::string>& groupName() const { return groupName_; }
   [[nodiscard]] const std::optional<std::string>& subGroupName() const { return subGroupName_; }
-  // "Haptics-Stats"; an absent name is "(null)". Snapshots are keyed by it.
+  // Group and subgroup, such as "Haptics-Stats"; an absent name reads "(null)". Snapshots are keyed
+  // by this text.
   [[nodiscard]] std::string description() const;
 
  private:

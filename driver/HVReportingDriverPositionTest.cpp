@@ -8,12 +8,12 @@ namespace {
 
 using namespace driver_testing;
 
-// Each of the groups in turn fails.
+// Each of the groups fails in turn.
 class HVReportingDriverPositionTest : public DriverUtilityTest,
                                       public testing::WithParamInterface<std::size_t> {
  protected:
   HVReportingDriverPositionTest() { setAll(1); }
-  // What each group's channel has counted.
+  // What the channel of each group has counted.
   void setAll(std::int64_t count) {
     for (const char* group : kGroups) {
       platform_.ioReport.setGroup(group, {simpleChannel(group, count)});
@@ -27,7 +27,7 @@ class HVReportingDriverPositionTest : public DriverUtilityTest,
     }
     return subscribed;
   }
-  // The groups that do not fail, each behind these words.
+  // The groups that do not fail, each after these words.
   static Texts othersAfter(std::string_view words) {
     Texts texts;
     for (const char* group : kGroups) {
@@ -38,7 +38,7 @@ class HVReportingDriverPositionTest : public DriverUtilityTest,
   // The simple values that were recorded, without their keys.
   std::size_t recordedEntries() const {
     const auto messages = recorded();
-    // The tag is the one entry that no channel gave.
+    // The tag is the only entry that does not come from a channel.
     return messages.empty() ? 0 : messages.front().size() - 1;
   }
 };

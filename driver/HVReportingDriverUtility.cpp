@@ -26,7 +26,8 @@ struct DriverNames {
   Name subGroup;
 };
 
-// The channel groups that are reported, in the order of their reports.
+// The channel groups that are reported, in the order of their reports. The list is part of the
+// interface; sources on this platform file their channels under these names.
 constexpr std::array kDrivers{
     DriverNames{"TarnoQ7AMP", std::nullopt},
     DriverNames{"Speaker", std::nullopt},
@@ -55,8 +56,8 @@ IOReportService::Samples createSamples(const HVReportingIOChannelSubscription& s
       subscription.subscription(), subscription.subscribedChannels(), moment, error);
 }
 
-// The change since the snapshot, or null. A delta that fails is reported with the text of a sample
-// that fails; that is kept.
+// The change since the snapshot, or null. A failed delta is logged with the text of a failed
+// sample; the text is part of the interface.
 IOReportService::Samples createDelta(const DriverSnapShot& snapShot, const std::string& description,
                                      const IOReportService::Samples& current) {
   const auto found = snapShot.find(description);
@@ -74,6 +75,7 @@ void send(const HVReportingDriverUtility::DriverStats& stats, AudioEventType typ
   HVReportingTallyhubBridge::handleEvent(stats, AudioEventCategory::kIOReporting, type, session);
 }
 
+// Removes what keys use as separators, so that a key has a fixed number of parts.
 void appendCleaned(std::string& text, std::string_view part) {
   std::ranges::copy_if(part, std::back_inserter(text),
                        [](char letter) { return letter != '_' && letter != ' '; });
@@ -91,8 +93,9 @@ struct HistogramText {
   std::string buckets;
 };
 
-// The lowest bound never rises above 0 and the highest never falls below it. A bucket whose bounds
-// cannot be read is not skipped: it counts with those of the bucket before it.
+// `lower` never rises above 0 and `upper` never falls below 0; this arithmetic is required. A
+// bucket whose bounds cannot be read is not skipped: it takes the bounds of the bucket before it,
+// which is required as well.
 HistogramText describeBuckets(const IOReportChannel& channel, std::int32_t count) {
   HistogramText text;
   std::int64_t lower = 0;
@@ -104,7 +107,7 @@ HistogramText describeBuckets(const IOReportChannel& channel, std::int32_t count
     text.upper = std::max(text.upper, upper);
     const std::uint64_t hits = IOReportHistogramGetBucketHits(channel, index);
     if (hits == 0) continue;
-    // Written as a signed number.
+    // The format prints hits as a signed number.
     text.buckets += std::to_string(lower) + "-" + std::to_string(upper) + ":" +
                     std::to_string(static_cast<std::int64_t>(hits)) + ";";
   }
@@ -126,7 +129,7 @@ void HVReportingDriverUtility::subscribe(const HVReportingDriver& driver) {
   IOReportService& reports = platform::ioReport();
   std::optional<IOReportError> error;
   const auto channels = reports.IOReportCopyChannelsInGroup(group, subGroup, error);
-  // Said even when channels came with it.
+  // Logged even if channels came back with the error.
   if (error.has_value()) {
     kDriverLog.error("error ", error->code, " getting channels for driver ", shown(group), "-",
                      shown(subGroup));
@@ -144,6 +147,7 @@ void HVReportingDriverUtility::subscribe(const HVReportingDriver& driver) {
   if (subscribed != nullptr) {
     subscription.setSubscribedChannels(std::move(subscribed));
     ioChannelSubscriptions_.push_back(std::move(subscription));
+    // The doubled word is part of the interface.
     kDriverLog.info("subscribed to group group ", shown(group), "-", shown(subGroup));
   } else if (error.has_value()) {
     kDriverLog.error("error ", error->code, " creating subscription for ", shown(group), "-",
@@ -153,7 +157,7 @@ void HVReportingDriverUtility::subscribe(const HVReportingDriver& driver) {
 
 DriverSnapShot HVReportingDriverUtility::getSnapShot() const {
   DriverSnapShot snapShot;
-  // The drivers are read once for all groups, after the session has started.
+  // One moment for all groups: the drivers are read once, after the session has started.
   const auto moment = platform::ioReport().makeMoment();
   for (const auto& subscription : ioChannelSubscriptions_) {
     std::string description = subscription.driver().description();
@@ -178,7 +182,7 @@ void HVReportingDriverUtility::sendDriverLogsForSession(
     std::optional<IOReportError> error;
     const auto current = createSamples(subscription, *moment, error);
     kDriverLog.info("done getting latest samples");
-    // Said after the sampling is, also of a session without a snapshot.
+    // Sampled also for a session without a snapshot, because an error of the sample is logged.
     if (current == nullptr) logSampleError(error);
     if (current == nullptr || !snapShot.has_value()) continue;
     const auto delta = createDelta(*snapShot, subscription.driver().description(), current);
@@ -210,6 +214,7 @@ void HVReportingDriverUtility::addChannel(const IOReportChannel& channel, Stats&
                        " subgroup : ", shown(IOReportChannelGetSubGroup(channel)));
       return;
   }
+  // Reached only for a number that no enumerator has: sources may have formats of their own.
   kDriverLog.error("The IOReportingFormat ", number,
                    " is not supported group : ", shown(IOReportChannelGetGroup(channel)),
                    " subgroup : ", shown(IOReportChannelGetSubGroup(channel)));
@@ -217,7 +222,7 @@ void HVReportingDriverUtility::addChannel(const IOReportChannel& channel, Stats&
 
 void HVReportingDriverUtility::processSimpleData(const IOReportChannel& channel,
                                                  DriverStats& driverStats) {
-  // Zero and negative counts are dropped on purpose.
+  // Zero and negative counts are dropped; this is required.
   const std::int64_t value = IOReportSimpleGetIntegerValue(channel);
   if (value < 1) return;
   driverStats.set(platform::Key(getDriverStatsKey(channel, kSimpleType)), value);
@@ -254,7 +259,7 @@ void HVReportingDriverUtility::processStateData(const IOReportChannel& channel,
             ",duty_cycle:" + std::to_string(IOReportStateGetDutyCycle(channel, index)) + ";";
   }
   kDriverLog.debug("the current reported data is : ", text);
-  // Reported even when no state held at all.
+  // Reported even if the text is empty: the receiver sees that the channel exists.
   driverStats.set(platform::Key(getDriverStatsKey(channel, kStateType)), text);
 }
 
@@ -262,7 +267,7 @@ std::string HVReportingDriverUtility::getDriverStatsKey(const IOReportChannel& c
                                                         std::string_view type) {
   std::string key;
   if (const Name driver = IOReportChannelGetDriverName(channel)) {
-    // What follows the "<" tells one instance of the driver from another.
+    // What follows the "<" distinguishes instances of one driver. All of them share a key.
     appendKeyPart(key, driver->substr(0, driver->find('<')));
   }
   appendKeyPart(key, IOReportChannelGetGroup(channel));

@@ -14,39 +14,42 @@ namespace halvox {
 
 class HVReportingSession;
 
-// Measures what the audio drivers counted while a session ran: a snapshot of a fixed list of
-// channel groups at its start, and the difference to it, as up to three messages, at its stop.
+// Measures what the audio drivers counted while a session ran. It takes a snapshot of a fixed list
+// of channel groups when the session starts, and sends the difference as up to three messages when
+// the session stops.
 //
-// Subscribes once, when it is made, to the channels that there are then: a driver, and a channel of
-// a driver, that shows up later is not reported until the service starts again. One a process,
-// owned by the service's delegate; made before any client can connect, and only read afterwards, so
-// any thread may use it. Reports no failure: a group without channels is left out for good, a
-// sample that fails is left out that one time, and both are logged.
+// Lifecycle: it subscribes once, in its constructor, to the channels that exist then. A channel
+// that appears later is not reported until the service starts again.
+// Owner: the service's delegate, which makes one before any client can connect.
+// Thread: any, because nothing changes after the constructor. Snapshots and reports wait for the
+// sources of the counters.
+// Failure: only logged. A group without channels is skipped for the life of the process; a sample
+// that fails is skipped this one time.
 class HVReportingDriverUtility {
  public:
   using DriverStats = platform::Dictionary;
 
   HVReportingDriverUtility();
 
-  // In the order of the fixed list; only groups that had channels and could be subscribed.
+  // In the order of the fixed list; only the groups that had channels and could be subscribed to.
   [[nodiscard]] const std::vector<HVReportingIOChannelSubscription>& ioChannelSubscriptions()
       const {
     return ioChannelSubscriptions_;
   }
 
-  // Samples every subscription, all at one moment. Waits for the sources of the counters.
+  // Samples every subscription at one moment. Blocks until the sources have answered or are late.
   [[nodiscard]] DriverSnapShot getSnapShot() const;
   // Samples again and sends what changed since the session's snapshot, of the channels that are in
-  // it, through the session and to the analytics service: one message for each format that has
-  // something to report. Does not change the snapshot; without one nothing is sent.
+  // the snapshot. Each format with something to report becomes one message, which goes through the
+  // session and to the analytics service. The snapshot stays as it is; without one nothing is sent.
   void sendDriverLogsForSession(const std::shared_ptr<HVReportingSession>& session) const;
 
-  // Add one channel's entry, if it has something to tell.
+  // Each adds one channel's entry to the dictionary, unless there is nothing to report.
   static void processSimpleData(const platform::IOReportChannel& channel, DriverStats& driverStats);
   static void processHistogramData(const platform::IOReportChannel& channel,
                                    DriverStats& driverStats);
   static void processStateData(const platform::IOReportChannel& channel, DriverStats& driverStats);
-  // The key of a channel: "AmpDriver_Haptics_Stats_Simple_PeakLevel".
+  // The key of a channel, such as "AmpDriver_Haptics_Stats_Simple_PeakLevel".
   static std::string getDriverStatsKey(const platform::IOReportChannel& channel,
                                        std::string_view type);
 

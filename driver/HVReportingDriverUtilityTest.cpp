@@ -172,7 +172,7 @@ TEST_F(HVReportingDriverUtilityTest, AChannelThatIsNotInTheSnapshotIsNotSent) {
             (Dictionary{{"Amp_Speaker_Simple_a", 4}, {"audiotag", "IOReportingSimple"}}));
 }
 
-// The groups are asked for one after the other, and a driver may count in between.
+// The groups are sampled one after the other, and a driver may count in between.
 TEST_F(HVReportingDriverUtilityTest, AllGroupsOfASnapshotAreOfOneMoment) {
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
   platform_.ioReport.setGroup("Tx-(null)", {simpleChannel("b", 1)});

@@ -7,10 +7,11 @@
 
 namespace halvox {
 
-// One live subscription to a channel group of the drivers. Belongs to the sampler that made it.
+// One live subscription to a group of driver channels. The sampler that made it owns it. Immutable
+// once it is in the sampler's list.
 class HVReportingIOChannelSubscription {
  public:
-  // Without a subscription and channels yet.
+  // Has no subscription and no channels yet.
   explicit HVReportingIOChannelSubscription(HVReportingDriver driver)
       : driver_(std::move(driver)) {}
 
@@ -21,7 +22,7 @@ class HVReportingIOChannelSubscription {
   void setSubscription(platform::IOReportService::Subscription subscription) {
     subscription_ = std::move(subscription);
   }
-  // The channels that were really subscribed.
+  // The channels that were subscribed to, which may be fewer than were asked for.
   [[nodiscard]] const platform::IOReportService::Channels& subscribedChannels() const {
     return subscribedChannels_;
   }

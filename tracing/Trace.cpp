@@ -12,6 +12,7 @@ void Trace::processTracepoints(const TraceData::Session& session, const TraceDat
   for (const auto& measurement : measurements_) measurement->processTracepoints(session, events);
 }
 
+// Does not clear what an earlier call added (see the header).
 Trace::Results Trace::getResults() {
   for (const auto& measurement : measurements_) {
     for (const std::uint64_t value : measurement->getResults()) {

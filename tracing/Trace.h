@@ -11,10 +11,14 @@
 
 namespace halvox {
 
-// One trace: what to measure in its events, and what was measured. Owned by the runner.
+// One trace: the measurements to make in its events, and their results.
+//
+// The runner owns it. Used by one thread at a time: by the runner's queue while it records, by the
+// stopping thread afterwards. Nothing in it fails.
 class Trace {
  public:
-  // Values by measurement; those of one name in the order in which they were found.
+  // Nanoseconds, or arguments of events, by the name of their measurement. Values of one name are
+  // in the order in which they were found.
   using Results = std::multimap<std::string, std::uint64_t>;
   enum class Kind : std::uint8_t { kKernelTrace, kSignpost };
 
@@ -24,10 +28,10 @@ class Trace {
   [[nodiscard]] bool isKernelTrace() const { return kind_ == Kind::kKernelTrace; }
 
   void addTraceDataToCollect(std::unique_ptr<TraceInterval> interval);
-  // Lets every measurement look through the events, in the order in which they were added.
+  // Passes the events to every measurement, in the order in which the measurements were added.
   void processTracepoints(const TraceData::Session& session, const TraceData::Events& events);
-  // Gathers what the measurements found and returns all that was ever gathered: a second call
-  // returns every value twice. Call it once.
+  // Adds the results of all measurements to the trace's own and returns these. A second call adds
+  // them again and returns every value twice; that is required, so call it once.
   Results getResults();
 
  private:

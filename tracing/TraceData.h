@@ -9,8 +9,10 @@
 
 namespace halvox {
 
-// One measurement of a trace: a name and the values found for it. Owned by its trace; belongs to
-// whoever processes the trace. Values and the count add up over several passes.
+// One measurement of a trace: a name and the values found for it.
+//
+// Its trace owns it. Used by one thread at a time. Values and the count accumulate over several
+// passes.
 class TraceData {
  public:
   using Session = platform::KtraceService::Session;
@@ -28,8 +30,10 @@ class TraceData {
   [[nodiscard]] bool hasResults() const { return !results_.empty(); }
   // In the order in which they were found.
   [[nodiscard]] std::vector<std::uint64_t> getResults() const { return results_; }
-  // Summed and divided in single precision; without results not a number.
+  // Sum and division are in single precision, as the interface demands. Without results it is not a
+  // number.
   [[nodiscard]] float getAverageResult() const;
+  // Only intervals count; values of a TracePoint leave it at 0.
   [[nodiscard]] std::uint32_t getNumTimesTraced() const { return count_; }
 
  protected:

@@ -16,7 +16,8 @@ struct Discarded {
   std::uint32_t stops = 0;
 };
 
-// The line about stops tells the number of starts; that is kept.
+// The line about stops prints the number of starts. That is part of the interface, and so are the
+// two levels: a single-thread interval logs at debug, the other at default level.
 void logDiscarded(platform::LogLevel level, const Discarded& discarded, const std::string& name) {
   platform::LogCategory& category = HVReportingTraceCategory();
   if (discarded.starts != 0) {
@@ -42,7 +43,7 @@ void TraceInterval::processTracepoints(const Session& session, const Events& eve
 }
 
 void TraceInterval::processTracepointsSingleThread(const Session& session, const Events& events) {
-  std::map<std::uint64_t, std::uint64_t> starts;  // of each thread that has begun
+  std::map<std::uint64_t, std::uint64_t> starts;  // by thread: the begin that waits for its end
   Discarded discarded;
   for (const platform::trace_point& event : events) {
     if (event.debugid == codes_.begin) {
@@ -81,6 +82,8 @@ void TraceInterval::processTracepointsAnyThread(const Session& session, const Ev
 }
 
 void TraceInterval::addInterval(const Session& session, std::uint64_t begin, std::uint64_t end) {
+  // Converts each timestamp before subtracting: the conversion rounds, so converting the difference
+  // would give another result.
   const platform::KtraceService& ktrace = platform::ktrace();
   addResult(ktrace.ktrace_convert_timestamp_to_nanoseconds(session, end) -
             ktrace.ktrace_convert_timestamp_to_nanoseconds(session, begin));

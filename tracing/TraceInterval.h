@@ -6,24 +6,30 @@
 
 namespace halvox {
 
-// Which event begins an interval, which ends it, and whether both must come from one thread.
+// The event that begins an interval, the event that ends it, and whether both must come from the
+// same thread. Codes are compared as whole identifiers, function qualifiers included.
 struct TraceIntervalCodes {
   std::uint32_t begin = 0;
   std::uint32_t end = 0;
   bool matchByThread = false;
 };
 
-// Measures the nanoseconds from an event to the next one that ends it. An event that is both
-// begins; a begin that is followed by another begin is discarded, and so is an end without a begin.
+// Measures the nanoseconds from each begin event to the end event that follows it.
+//
+// An event that is both counts as a begin. A begin that another begin follows is discarded, and so
+// is an end without a begin; the numbers are logged. State between events lives only during one
+// pass. Owner and thread are those of TraceData.
 class TraceInterval : public TraceData {
  public:
   TraceInterval(std::string name, TraceIntervalCodes codes)
       : TraceData(std::move(name)), codes_(codes) {}
 
   void processTracepoints(const Session& session, const Events& events) override;
-  // Begin and end must come from the same thread.
+  // Begin and end must come from the same thread. One pass, with a map of the threads that have
+  // begun.
   virtual void processTracepointsSingleThread(const Session& session, const Events& events);
-  // Begin and end may come from different threads. A begin at tick 0 counts as none.
+  // Begin and end may come from different threads. A begin at tick 0 counts as no begin; this is
+  // required.
   virtual void processTracepointsAnyThread(const Session& session, const Events& events);
 
  private:

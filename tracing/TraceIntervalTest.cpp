@@ -43,7 +43,7 @@ class TraceIntervalTest : public testing::Test {
     return "DISCARDED " + std::to_string(count) +
            " trace Start points for interval IO because no stop points found";
   }
-  // Said of any number of stops, with the number of starts.
+  // The line about stops prints the number of starts, however many stops there are.
   static std::string stops(int startCount) {
     return "DISCARDED " + std::to_string(startCount) +
            " trace Stop points for interval IO because no start points found";
@@ -183,7 +183,7 @@ TEST_F(TraceIntervalTest, AverageIsTakenInSinglePrecision) {
   interval.processTracepoints(
       session_, {event(kBegin, 1), event(kEnd, 16777218), event(kBegin, 1), event(kEnd, 2)});
 
-  // 16777217 has no single-precision form, and neither has its sum with 1.
+  // Neither 16777217 nor its sum with 1 can be represented in single precision.
   EXPECT_EQ(interval.getAverageResult(), 8388608.0F);
 }
 

@@ -4,8 +4,8 @@
 
 namespace halvox {
 
-// The log category of everything about traces, made on first use and kept for the life of the
-// process. Any thread may ask.
+// The log category of everything about traces. The first call makes it; it lives as long as the
+// process. Any thread may call.
 platform::LogCategory& HVReportingTraceCategory();
 
 }  // namespace halvox

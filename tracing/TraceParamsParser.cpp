@@ -17,6 +17,7 @@ using platform::Value;
 
 constexpr platform::UnitLog kLog(&HVReportingTraceCategory, "TraceParamsParser");
 
+// One text for reading and for parsing; both are part of the interface.
 constexpr const char* kReadingFailed = "Reading from plist file failed with error: ";
 constexpr const char* kTracesFailed = "Failed to load Trace Parameter Array with error: ";
 constexpr const char* kTraceFailed = "Failed to load Trace Parameter dictionary with error : ";
@@ -36,7 +37,7 @@ std::string textOf(const Dictionary& dictionary, std::string_view key) {
   return value == nullptr ? std::string(kNothing) : platform::describe(*value);
 }
 
-// What is wrong with a value that should be a container.
+// Describes a value that should be a container.
 std::string kindError(const Value* value, std::string_view expected) {
   std::string text = "expected " + std::string(expected) + ", found ";
   if (value == nullptr) return text += kNothing;
@@ -59,8 +60,8 @@ std::string kindError(const Value* value, std::string_view expected) {
   return text;
 }
 
-// Reads as many hexadecimal digits as there are from the start, after a "0x" if there is one.
-// Without a digit 0, and of too large a number the largest.
+// The hexadecimal number at the start of the text, with or without "0x". 0 if there is no digit;
+// the largest number if there are too many digits.
 std::uint32_t scanHexadecimal(std::string_view text) {
   constexpr int kHexadecimal = 16;
   if (text.starts_with("0x") || text.starts_with("0X")) text.remove_prefix(2);
@@ -69,8 +70,8 @@ std::uint32_t scanHexadecimal(std::string_view text) {
   return result.ec == std::errc::result_out_of_range ? UINT32_MAX : code;
 }
 
-// Reads one file. A trace point of an unknown type is taken for one of the type before it, with its
-// own codes: that is intended.
+// Reads one file. A trace point of an unknown type takes the type of the trace point before it,
+// with its own codes; this carry-over is required.
 class FileReader {
  public:
   FileReader(const platform::PropertyListService& lists, TraceParamsParser::Listener& listener)
@@ -87,7 +88,8 @@ class FileReader {
  private:
   void report(const char* what, const std::string& why) { listener_.onError(what + why); }
 
-  // The dictionary that the file holds.
+  // The dictionary at the root of the file; empty after a failure. Parsing is tried even without
+  // bytes, because its failure is logged as well.
   Dictionary readRoot(const std::string& path) {
     std::optional<Error> error;
     const auto bytes = lists_.readFile(path, error);
@@ -116,6 +118,8 @@ class FileReader {
   }
 
   void readTrace(const Dictionary& trace) {
+    // The first trace that has a name gives the record's name; likewise the first signpost its
+    // type.
     if (params_.name.empty()) {
       params_.name = textOf(trace, TraceDataDescription);
       if (params_.name.empty()) listener_.onError("Description not found in the plist file");
@@ -140,6 +144,7 @@ class FileReader {
     if (kind_ == TracePointKind::kInterval) {
       params.endCode = scanHexadecimal(textOf(point, TracePointEndCode));
     }
+    // Reported before an impulse gets its end code: the log line shows the codes of the file.
     listener_.onTracePoint(params);
     if (kind_ == TracePointKind::kImpulse) params.endCode = params.beginCode;
     return params;
@@ -161,13 +166,14 @@ class FileReader {
   const platform::PropertyListService& lists_;
   TraceParamsParser::Listener& listener_;
   TraceParams params_;
-  TracePointKind kind_ = TracePointKind::kImpulse;
+  TracePointKind kind_ = TracePointKind::kImpulse;  // of the latest trace point
 };
 
 class LoggingListener final : public TraceParamsParser::Listener {
  public:
   void onError(const std::string& sentence) override { kLog.error("", sentence); }
   void onTracePoint(const TraceDataParams& point) override {
+    // Signed numbers and the line break are part of the interface.
     kLog.info("Loading tracepoint : ", static_cast<std::int32_t>(point.beginCode), " and ",
               static_cast<std::int32_t>(point.endCode), " \n finished parsing.");
   }

@@ -8,7 +8,7 @@
 
 namespace halvox {
 
-// Keys and values of a trace parameters file.
+// Keys and values of a trace parameters file. The constants' names are part of the interface.
 inline constexpr std::string_view TraceParamChildrenNodes = "Children";
 inline constexpr std::string_view TraceDataDescription = "Name";
 inline constexpr std::string_view TraceDataType = "TraceType";
@@ -27,44 +27,48 @@ inline constexpr std::string_view TracePointEventsMatchedBy = "EventsMatchedBy";
 inline constexpr std::string_view TracePointEventsMatchedByThread = "Thread";
 inline constexpr std::string_view TracePointEventsMatchedByProcess = "Process";
 
-// Reads a property-list file that describes a trace. Never gives up: what is missing or wrong is
-// logged, and reading goes on with what there is. Belongs to one thread; waits for the disk.
+// Reads a property-list file that describes a trace.
 //
-// Nested values count as if they had been printed and read again, which leaves texts in the place
-// of all scalars. What that makes of each kind of value:
+// It never gives up: what is missing or wrong is logged, and reading continues with the rest.
+// Clients name the file, so any content is possible. Belongs to one thread; blocks while it reads
+// the disk.
+//
+// Nested values are read as if each had been printed and parsed again, which turns all scalars into
+// texts. This peculiar rule is part of the interface. Its effect on each kind of value:
 //
 //   text          itself
 //   number        its decimal text: 42 as a code is hexadecimal 42; a boolean is "1" or "0"
-//   date, data    the text that describes it; no code, name or list of anything
-//   array,        the same with texts inside; as a text where one is expected, its description
+//   date, data    the text that describes it, which is never a code, a name or a list
+//   array,        the same with texts inside; where a text is expected, its description
 //   dictionary
 //   nothing       the text "(null)", which is neither an array nor a dictionary
 //
-// So a missing name is "(null)", a missing code 0 ("(" is no hexadecimal digit), a missing list or
-// one of another kind holds nothing, and a list's element that is no dictionary is one with no
-// keys.
+// A missing name is therefore "(null)". A missing code is 0, because "(" is not a hexadecimal
+// digit. A missing list, or a value of another kind in its place, is an empty list. An element that
+// is not a dictionary is an empty dictionary.
 class TraceParamsParser {
  public:
-  // What is found while a file is read, in its order.
+  // Receives what is found while a file is read, in the order of the file.
   class Listener {
    public:
     Listener() = default;
     Listener(const Listener&) = delete;
     Listener& operator=(const Listener&) = delete;
     virtual ~Listener() = default;
-    // Something is missing or wrong; the sentence that the log has.
+    // Something is missing or wrong. `sentence` is the text of the log line.
     virtual void onError(const std::string& sentence) = 0;
-    // A trace point, with its codes as they stand in the file.
+    // A trace point with its codes as they are in the file.
     virtual void onTracePoint(const TraceDataParams& point) = 0;
   };
 
   explicit TraceParamsParser(std::string fileName) : traceParamsFile_(std::move(fileName)) {}
 
   [[nodiscard]] const std::string& traceParamsFile() const { return traceParamsFile_; }
-  // What the file says; no trace points when it says nothing. A relative name starts from the
-  // process's current directory.
+  // The content of the file; without trace points if there is nothing to read. A relative name
+  // starts from the current directory of the process.
   [[nodiscard]] TraceParams loadTraceParams() const;
-  // The same for a program without the installed services: the listener gets what would be logged.
+  // The same for a program that has not installed the services, such as halvoxctl. The listener
+  // receives what the service would log.
   [[nodiscard]] TraceParams loadTraceParams(const platform::PropertyListService& lists,
                                             Listener& listener) const;
 

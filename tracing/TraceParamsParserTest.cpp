@@ -45,7 +45,7 @@ class TraceParamsParserTest : public testing::Test {
   platform::FakePlatform platform_;
 };
 
-// --- Who is told --------------------------------------------------------------------------------
+// --- The listener -------------------------------------------------------------------------------
 
 struct Recorder final : TraceParamsParser::Listener {
   void onError(const std::string& sentence) override { errors.push_back(sentence); }

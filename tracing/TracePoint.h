@@ -6,10 +6,11 @@
 
 namespace halvox {
 
-// Measures an argument of each event with one code. Its values are not counted as traced.
+// Records one argument of each event with its code. Does not count as traced. No parameters file
+// creates one so far; the type is part of the interface. Owner and thread are those of TraceData.
 class TracePoint final : public TraceData {
  public:
-  // `argumentIndex` is 1 to 4; with any other nothing is ever found.
+  // `argumentIndex` is 1 to 4. Any other index finds nothing.
   TracePoint(std::string name, std::uint32_t code, std::int32_t argumentIndex)
       : TraceData(std::move(name)), code_(code), argumentIndex_(argumentIndex) {}
 

@@ -24,23 +24,27 @@ constexpr std::uint32_t kResultsVersion = 4;
 constexpr std::uint32_t kNoFlags = 0;
 constexpr std::uint32_t kDirectoryPermissions = 0777;
 constexpr std::string_view kQueueLabel = "Tracing Queue";
-// The identifiers that are recorded.
+// The range of identifiers that is recorded: what the audio frameworks emit.
 constexpr std::uint32_t kFirstIdentifier = 0x21040000;
 constexpr std::uint32_t kLastIdentifier = 0x2104408A;
+// Room for a usual trace; a longer one grows the vector.
 constexpr std::size_t kExpectedEvents = 10'000;
 
 }  // namespace
 
-// How many traces have completed, with a signal for each.
+// How many traces have completed, and a signal for each. Shared by the runner and its recordings,
+// because a recording may complete after the runner has been destroyed.
 struct TraceRunner::Completions {
-  std::atomic<std::uint32_t> count{0};  // read after the signal, which orders it
+  std::atomic<std::uint32_t> count{0};  // relaxed: read after the signal, which orders it
   const std::shared_ptr<platform::DispatchSemaphore> signals =
       platform::dispatch().createSemaphore(0);
 };
 
-// One trace while it is recorded. Belongs to the runner until it starts, then to the runner's queue
-// until it has completed. A recording that was set up must be torn down, by its completion or by
-// whoever gives it up: only then is it certain that no handler, which leads here, is called.
+// The recording of one trace.
+//
+// Belongs to the runner until it starts, then to the runner's queue until it has completed. A
+// recording that was set up must be torn down, by its completion or by the runner's destructor. Its
+// handlers hold `this`, and only the tear-down guarantees that none is called any more.
 class TraceRunner::Recording {
  public:
   Recording(std::string name, Trace::Kind kind, std::shared_ptr<Completions> completions)
@@ -85,21 +89,22 @@ class TraceRunner::Recording {
  private:
   Trace trace_;
   const std::shared_ptr<Completions> completions_;
-  platform::KtraceService::Session session_;  // null: not set up, or torn down
+  platform::KtraceService::Session session_;  // null before the set-up and after the tear-down
   TraceData::Events events_;
 };
 
 TraceRunner::TraceRunner()
     : queue_(platform::dispatch().createSerialQueue(
-          // A stop waits for it on the reporting queue, so it must not run after what gives way.
+          // Not of a lower quality: a stop waits for it on the reporting queue.
           kQueueLabel, platform::QualityOfService::kUserInteractive,
           platform::QueueThreading::kOwnThread)),
       started_(platform::dispatch().createSemaphore(0)),
       completions_(std::make_shared<Completions>()) {}
 
-// A runner can go while it records: when its session is replaced by another without a stop, or is
-// no test any more when it stops. Its queue ends the recordings, behind starts that still wait for
-// the tracer, because whoever lets go of a session must not wait.
+// A runner can be destroyed while it records: its session was replaced under its ID without a stop,
+// or is not a test session any more when it stops. The queue ends the recordings, after starts that
+// still wait for the tracer. The destructor itself does not wait, because it runs on the reporting
+// queue.
 TraceRunner::~TraceRunner() {
   if (state_ != State::kRecording) return;
   for (const auto& recording : recordings_) {
@@ -140,7 +145,8 @@ void TraceRunner::runTraces() {
     recording->setupTracing();
     kLog.info("Starting tracing: ", trace.name());
     recording->subscribe();
-    // The tracer may take seconds to start.
+    // On the queue, because the tracer may take seconds to start and every client waits for the
+    // thread that starts sessions.
     queue_->async(platform::JobWeight::kMayBlock, [recording, queue = queue_, started = started_] {
       recording->startTracing(queue);
       started->signal();
@@ -151,7 +157,7 @@ void TraceRunner::runTraces() {
 void TraceRunner::stopTracingandProcessResults() {
   if (state_ != State::kRecording) return;
   state_ = State::kFinished;
-  // So that what goes wrong at the start is logged before the stop.
+  // An error of the start must be logged before the lines of the stop.
   for (const auto& recording : recordings_) {
     if (recording->trace().isKernelTrace()) started_->wait();
   }
@@ -180,7 +186,7 @@ void TraceRunner::printTraceResults(const Results::value_type& entry) {
     std::uint64_t minimum;
     std::uint64_t maximum;
   };
-  std::vector<Summary> summaries;  // values of one name stand together
+  std::vector<Summary> summaries;  // a multimap keeps the values of one name together
   for (const auto& [name, value] : entry.second) {
     if (summaries.empty() || summaries.back().name != name) {
       summaries.push_back({name, 0, value, value});
@@ -200,6 +206,7 @@ void TraceRunner::writeScoresheet() const {
   kLog.info("Completed trace....In write perf data.... ", results_.size());
   if (const auto error = platform::files().createDirectory(HVReportingTracingLogsDirectory,
                                                            kDirectoryPermissions)) {
+    // Not fatal by itself: opening the file fails next if the directory is really missing.
     kLog.error("can't create logging directory at ", HVReportingTracingLogsDirectory, ": ",
                error->description);
   }

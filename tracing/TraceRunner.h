@@ -12,24 +12,27 @@
 
 namespace halvox {
 
+// Fixed by the interface; the platform puts its storage root in front of it.
 inline constexpr std::string_view HVReportingTracingLogsDirectory =
     "/private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Traces";
 
-// Records a kernel trace for each trace that it was given, and writes what was measured to a
-// results file.
+// Records a kernel trace for each trace that it was given, and writes the measurements to a results
+// file.
 //
 //   made --createTraceFromTraceParams--> made --runTraces--> recording
 //        --stopTracingandProcessResults--> finished
 //
-// A runner records once: what does not suit its state does nothing, so a finished runner cannot be
-// stopped again and one that never ran has nothing to stop. Traces of the same parameters are
-// recorded again by another runner.
+// A runner records once: a call that does not suit its state does nothing. To trace the same
+// parameters again, make another runner; the traces of this one keep their results, and a second
+// recording would add to them.
 //
-// The caller is one thread at a time. What waits for the tracer is done by the runner's own serial
-// queue, where events and completions come too; the caller waits for it only when it stops. Owned
-// by its session; when it goes while it records, its queue ends the recordings and nothing is
-// written. Failures are logged and the rest goes on; only a results file that cannot be opened ends
-// the process, with exit status 1, and that is intended.
+// Owner: the session. If it destroys the runner during a recording, the runner's queue ends the
+// recording and nothing is written.
+// Threads: one caller at a time. Everything that waits for the tracer runs on the runner's own
+// serial queue, where events and completions arrive too; the caller waits for that queue only in
+// the stop.
+// Failure: logged, and the rest continues. Only a results file that cannot be opened ends the
+// process, with exit status 1; this hard end is required.
 class TraceRunner {
  public:
   TraceRunner();
@@ -37,16 +40,17 @@ class TraceRunner {
   TraceRunner& operator=(const TraceRunner&) = delete;
   virtual ~TraceRunner();
 
-  // Adds a trace with an interval for each trace point, whatever its kind. Null is logged.
+  // Adds a trace with an interval for each trace point, whatever the point's kind; an impulse never
+  // yields a result, because its begin and end are equal. Null is logged and ignored.
   void createTraceFromTraceParams(const TraceParams* params);
-  // Starts to record all kernel traces; signposts are not started. Never blocks: the recording
+  // Starts to record all kernel traces. Signposts are not started. Never blocks: the recording
   // begins, or its failure is logged, a little later.
   void runTraces();
-  // Ends the traces, one strictly after the other, and writes the results file. Blocks until every
-  // trace has completed, without a time limit.
+  // Ends the traces strictly one after the other and writes the results file. Blocks until every
+  // trace has completed, without a time limit; the interface demands that.
   void stopTracingandProcessResults();
 
-  // Whether it has not run yet.
+  // True until runTraces().
   [[nodiscard]] bool canRun() const { return state_ == State::kMade; }
   [[nodiscard]] std::size_t getNumTraces() const { return recordings_.size(); }
   [[nodiscard]] static std::uint32_t getResultsVersion();
@@ -62,9 +66,9 @@ class TraceRunner {
 
   State state_ = State::kMade;
   const std::shared_ptr<platform::DispatchQueue> queue_;
-  const std::shared_ptr<platform::DispatchSemaphore> started_;  // signalled after each start
+  const std::shared_ptr<platform::DispatchSemaphore> started_;  // one signal for each start
   const std::shared_ptr<Completions> completions_;              // shared with the recordings
-  // Shared with the jobs of the queue, which may still need them when the runner has gone.
+  // Shared with the jobs of the queue, which may need them after the runner has been destroyed.
   std::vector<std::shared_ptr<Recording>> recordings_;
   Results results_;
 };

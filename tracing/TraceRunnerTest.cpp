@@ -34,7 +34,7 @@ class TraceRunnerTest : public testing::Test {
   void record(std::vector<platform::trace_point> events) {
     platform_.ktrace.setEvents(std::move(events));
   }
-  // Runs, and lets the tracer start.
+  // Runs the runner and lets the tracer start.
   void run() {
     runner_.runTraces();
     platform_.dispatch.runUntilIdle();
@@ -96,7 +96,7 @@ TEST_F(TraceRunnerTest, TracesRunOnAQueueOfTheirOwnWithAThreadOfItsOwn) {
   add(params("Startup"));
   runAndStop();
 
-  // What starts and stops a trace may wait for the tracer.
+  // The jobs that start and stop a trace may wait for the tracer.
   EXPECT_EQ(platform_.dispatch.weights("Tracing Queue"),
             (std::vector<platform::JobWeight>{platform::JobWeight::kMayBlock,
                                               platform::JobWeight::kMayBlock,
