@@ -5,7 +5,7 @@
 #include <spawn.h>
 #include <sys/wait.h>
 
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 
 namespace halvox::client {
 namespace {

@@ -8,7 +8,7 @@
 #include <gtest/gtest.h>
 
 #include "client/HalvoxClient.h"
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 
 namespace halvox::client {
 
@@ -18,9 +18,9 @@ inline constexpr Category kPlayback = 4;
 inline constexpr EventType kStart = 1;
 
 // A service that plays along, in a directory of the test's own.
-class HalvoxClientTest : public testing::Test {
+class HalvoxClientFixture : public testing::Test {
  protected:
-  HalvoxClientTest() : socketPath_(scratch_.path("reporting.sock")), service_(socketPath_) {}
+  HalvoxClientFixture() : socketPath_(scratch_.path("reporting.sock")), service_(socketPath_) {}
 
   [[nodiscard]] Options options() const {
     return {.socketPath = socketPath_,

@@ -12,7 +12,9 @@ namespace {
 
 using namespace std::chrono_literals;
 
-TEST_F(HalvoxClientTest, MessagesWaitForAServiceThatIsNotThereYet) {
+class HalvoxClientReconnectTest : public HalvoxClientFixture {};
+
+TEST_F(HalvoxClientReconnectTest, MessagesWaitForAServiceThatIsNotThereYet) {
   service_.vanish();
   HalvoxClient client(options());
   client.createSession(7);
@@ -27,7 +29,7 @@ TEST_F(HalvoxClientTest, MessagesWaitForAServiceThatIsNotThereYet) {
   EXPECT_EQ(service_.members(), "createReportingSession sendMessage reporterIDValid");
 }
 
-TEST_F(HalvoxClientTest, MakesItsSessionsAgainBeforePendingMessagesFlow) {
+TEST_F(HalvoxClientReconnectTest, MakesItsSessionsAgainBeforePendingMessagesFlow) {
   HalvoxClient client(options());
   client.createSession(7);
   client.setServiceType(7, 2);
@@ -55,7 +57,7 @@ TEST_F(HalvoxClientTest, MakesItsSessionsAgainBeforePendingMessagesFlow) {
   EXPECT_EQ(client.counters().reconnects, 1U);
 }
 
-TEST_F(HalvoxClientTest, SessionStepsTakenWhileTheServiceWasAwayFollowTheirMessages) {
+TEST_F(HalvoxClientReconnectTest, SessionStepsTakenWhileTheServiceWasAwayFollowTheirMessages) {
   HalvoxClient client(options());
   client.createSession(7);
   client.start(7);
@@ -80,7 +82,7 @@ TEST_F(HalvoxClientTest, SessionStepsTakenWhileTheServiceWasAwayFollowTheirMessa
             "stopReportingSessionForID sendMessage destroyReportingSession reporterIDValid ");
 }
 
-TEST_F(HalvoxClientTest, MessagesInFlightAtALossAreLostAndNotSentAgain) {
+TEST_F(HalvoxClientReconnectTest, MessagesInFlightAtALossAreLostAndNotSentAgain) {
   HalvoxClient client(options());
   ASSERT_TRUE(client.flush(kPatience));
   service_.setStalled(true);
@@ -105,7 +107,7 @@ TEST_F(HalvoxClientTest, MessagesInFlightAtALossAreLostAndNotSentAgain) {
   EXPECT_TRUE(std::is_sorted(numbers.begin(), numbers.end()));
 }
 
-TEST_F(HalvoxClientTest, TellsItsHandlerOfEveryConnectionMadeAndLost) {
+TEST_F(HalvoxClientReconnectTest, TellsItsHandlerOfEveryConnectionMadeAndLost) {
   HalvoxClient client(options());
   ASSERT_TRUE(client.flush(kPatience));
   std::atomic<int> made{0};
@@ -122,7 +124,7 @@ TEST_F(HalvoxClientTest, TellsItsHandlerOfEveryConnectionMadeAndLost) {
   client.setConnectionHandler(nullptr);
 }
 
-TEST_F(HalvoxClientTest, DestructionDoesNotWaitForAServiceThatIsNotThere) {
+TEST_F(HalvoxClientReconnectTest, DestructionDoesNotWaitForAServiceThatIsNotThere) {
   service_.vanish();
   const auto before = std::chrono::steady_clock::now();
   {
@@ -133,7 +135,7 @@ TEST_F(HalvoxClientTest, DestructionDoesNotWaitForAServiceThatIsNotThere) {
   EXPECT_LT(std::chrono::steady_clock::now() - before, 900ms);
 }
 
-TEST_F(HalvoxClientTest, GivesUpWhatWaitsWhenSessionStepsPileUpWithoutAService) {
+TEST_F(HalvoxClientReconnectTest, GivesUpWhatWaitsWhenSessionStepsPileUpWithoutAService) {
   service_.vanish();
   HalvoxClient client(options());
   client.send(1, {{"n", 1}}, kPlayback, kStart);
@@ -152,7 +154,7 @@ TEST_F(HalvoxClientTest, GivesUpWhatWaitsWhenSessionStepsPileUpWithoutAService) 
   expectBalance(client.counters());
 }
 
-TEST_F(HalvoxClientTest, SurvivesAServiceThatComesAndGoesUnderLoad) {
+TEST_F(HalvoxClientReconnectTest, SurvivesAServiceThatComesAndGoesUnderLoad) {
   HalvoxClient client(options());
   std::atomic<bool> done{false};
   std::jthread sender([&] {

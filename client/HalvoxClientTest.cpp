@@ -14,6 +14,8 @@ namespace {
 
 using namespace std::chrono_literals;
 
+class HalvoxClientTest : public HalvoxClientFixture {};
+
 TEST_F(HalvoxClientTest, CarriesOutOperationsInTheirOrder) {
   HalvoxClient client(options());
 

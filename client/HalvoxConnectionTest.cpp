@@ -8,7 +8,7 @@
 #include <sys/un.h>
 
 #include "client/HalvoxClient.h"
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 
 namespace halvox::client {
 namespace {

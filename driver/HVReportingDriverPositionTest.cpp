@@ -1,6 +1,6 @@
 #include <gtest/gtest.h>
 
-#include "driver/DriverUtilityTest.h"
+#include "driver/DriverUtilityFixture.h"
 #include "driver/HVReportingDriverUtility.h"
 
 namespace halvox {
@@ -9,7 +9,7 @@ namespace {
 using namespace driver_testing;
 
 // Each of the groups fails in turn.
-class HVReportingDriverPositionTest : public DriverUtilityTest,
+class HVReportingDriverPositionTest : public DriverUtilityFixture,
                                       public testing::WithParamInterface<std::size_t> {
  protected:
   HVReportingDriverPositionTest() { setAll(1); }

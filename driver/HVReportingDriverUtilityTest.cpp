@@ -4,7 +4,7 @@
 
 #include <gtest/gtest.h>
 
-#include "driver/DriverUtilityTest.h"
+#include "driver/DriverUtilityFixture.h"
 
 namespace halvox {
 namespace {
@@ -13,7 +13,8 @@ using namespace driver_testing;
 
 using platform::IOReportFormat;
 using platform::JournalKind;
-using HVReportingDriverUtilityTest = DriverUtilityTest;
+
+class HVReportingDriverUtilityTest : public DriverUtilityFixture {};
 
 // --- Subscribing --------------------------------------------------------------------------------
 

@@ -1,5 +1,5 @@
 #include "backends/AudioIssueDetected.h"
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 namespace halvox {
 namespace {
@@ -11,7 +11,7 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 
 // The road of messages to the back-ends that take only some, on a build that is not internal.
-class HVReportingBackEndsTest : public ServiceTest {
+class HVReportingBackEndsTest : public ServiceFixture {
  protected:
   HVReportingBackEndsTest() {
     createAndStart(client_, 7);

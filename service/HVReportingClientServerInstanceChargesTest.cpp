@@ -5,7 +5,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 // What is charged to which client while its messages wait: the connection refuses requests by that.
 namespace halvox {
@@ -15,7 +15,7 @@ using platform::Array;
 using platform::Dictionary;
 using namespace std::chrono_literals;
 
-class HVReportingClientServerInstanceChargesTest : public ServiceTest {
+class HVReportingClientServerInstanceChargesTest : public ServiceFixture {
  protected:
   ~HVReportingClientServerInstanceChargesTest() override { platform_.dispatch.clear(); }
 

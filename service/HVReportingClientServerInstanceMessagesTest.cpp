@@ -1,4 +1,4 @@
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 namespace halvox {
 namespace {
@@ -14,7 +14,7 @@ using testing::Pair;
 using testing::UnorderedElementsAre;
 using namespace std::chrono_literals;
 
-class HVReportingClientServerInstanceMessagesTest : public ServiceTest {
+class HVReportingClientServerInstanceMessagesTest : public ServiceFixture {
  protected:
   HVReportingClientServerInstanceMessagesTest() {
     platform_.clock.setCurrentDate({1000.25});

@@ -2,7 +2,7 @@
 #include <string>
 #include <vector>
 
-#include "service/DelegateTest.h"
+#include "service/DelegateFixture.h"
 
 namespace halvox {
 namespace {
@@ -57,7 +57,7 @@ class NotingDelegate final : public TestDelegate {
   mutable std::vector<std::string> notes;
 };
 
-class HVReportingClientServerInstanceOrderTest : public DelegateTest<NotingDelegate> {
+class HVReportingClientServerInstanceOrderTest : public DelegateFixture<NotingDelegate> {
  protected:
   HVReportingClientServerInstanceOrderTest() {
     delegate_->clients.push_back(client_);

@@ -1,5 +1,5 @@
 #include "service/ReportingQueue.h"
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 namespace halvox {
 namespace {
@@ -13,7 +13,7 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::UnorderedElementsAre;
 
-class HVReportingClientServerInstanceRequestsTest : public ServiceTest {
+class HVReportingClientServerInstanceRequestsTest : public ServiceFixture {
  protected:
   HVReportingClientServerInstanceRequestsTest() { forgetSteps(); }
 

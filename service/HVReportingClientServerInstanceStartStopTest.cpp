@@ -1,4 +1,4 @@
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 // What start, stop and destroy do to a session and to the reply that a start holds back.
 
@@ -15,7 +15,7 @@ using testing::UnorderedElementsAre;
 constexpr const char* kSessionSeven =
     "reporterID=7,serviceName=unknown,ownerPid=100,HostApplicationDisplayID=Unknown,started=1";
 
-class HVReportingClientServerInstanceStartStopTest : public ServiceTest {
+class HVReportingClientServerInstanceStartStopTest : public ServiceFixture {
  protected:
   HVReportingClientServerInstanceStartStopTest() { forgetSteps(); }
 

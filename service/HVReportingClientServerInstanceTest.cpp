@@ -1,7 +1,7 @@
 #include "service/HVReportingClientServerInstance.h"
 
 #include "service/ReportingQueue.h"
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 namespace halvox {
 namespace {
@@ -14,7 +14,7 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using Lookup = HVReportingClientServerInstance::Lookup;
 
-class HVReportingClientServerInstanceTest : public ServiceTest {
+class HVReportingClientServerInstanceTest : public ServiceFixture {
  protected:
   Connection client_ = connect(100);
   Connection other_ = connect(101);
@@ -159,7 +159,7 @@ TEST_F(HVReportingClientServerInstanceTest, RequestsOfAConnectionThatEndedAreSti
   run();
 
   EXPECT_EQ(call->value(), Value(true));
-  EXPECT_EQ(ServiceTest::call(other_, "getAllReporters", {})->value(), Value(Array{}));
+  EXPECT_EQ(ServiceFixture::call(other_, "getAllReporters", {})->value(), Value(Array{}));
 }
 
 TEST_F(HVReportingClientServerInstanceTest, ResourceUseFollowsSessionsAndTheirContents) {

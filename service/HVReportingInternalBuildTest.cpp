@@ -1,5 +1,5 @@
 #include "backends/HVReportingUtility.h"
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 namespace halvox {
 namespace {
@@ -21,7 +21,7 @@ class InternalBuild final : public testing::Environment {
 const testing::Environment* const kInternalBuild =
     testing::AddGlobalTestEnvironment(new InternalBuild);  // owned by the test program
 
-class HVReportingInternalBuildTest : public ServiceTest {
+class HVReportingInternalBuildTest : public ServiceFixture {
  protected:
   HVReportingInternalBuildTest() {
     createAndStart(client_, 7);

@@ -1,6 +1,6 @@
 #include "platform/preferences.h"
 #include "service/ReportingQueue.h"
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 namespace halvox {
 namespace {
@@ -18,7 +18,7 @@ constexpr std::string_view kAccessory = "spatial-audio-accessory-feature";
 constexpr std::string_view kAccessoryNotification =
     "com.tarno.pavisk.spatial-audio-accessory-feature.changed";
 
-class HVReportingServiceDelegateFeaturesTest : public ServiceTest {
+class HVReportingServiceDelegateFeaturesTest : public ServiceFixture {
  protected:
   HVReportingServiceDelegateFeaturesTest() {
     platform_.clock.setCurrentDate({1000.25});

@@ -1,4 +1,4 @@
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 // The state that the service gives for captures of diagnostics.
 
@@ -7,7 +7,7 @@ namespace {
 
 using platform::Dictionary;
 
-class HVReportingServiceDelegateStateTest : public ServiceTest {
+class HVReportingServiceDelegateStateTest : public ServiceFixture {
  protected:
   // What the service gives when it is asked; none when it does not answer.
   std::optional<Dictionary> state() {

@@ -2,7 +2,7 @@
 
 #include "service/HVReportingServiceProtocol.h"
 #include "service/ReportingQueue.h"
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 namespace halvox {
 namespace {
@@ -14,7 +14,7 @@ using testing::IsEmpty;
 using testing::UnorderedElementsAre;
 using namespace std::chrono_literals;
 
-class HVReportingServiceDelegateTest : public ServiceTest {
+class HVReportingServiceDelegateTest : public ServiceFixture {
  protected:
   std::vector<platform::ProcessID> clientPids() const {
     std::vector<platform::ProcessID> pids;

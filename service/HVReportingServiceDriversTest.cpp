@@ -1,7 +1,7 @@
 #include <string>
 #include <vector>
 
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 // When sessions sample the drivers and tell what these counted.
 namespace halvox {
@@ -10,7 +10,7 @@ namespace {
 using platform::JournalKind;
 using Texts = std::vector<std::string>;
 
-class HVReportingServiceDriversTest : public ServiceTest {
+class HVReportingServiceDriversTest : public ServiceFixture {
  protected:
   // A service that found channels at its start.
   HVReportingServiceDriversTest() {

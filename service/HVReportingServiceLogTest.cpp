@@ -1,4 +1,4 @@
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 namespace halvox {
 namespace {
@@ -11,7 +11,7 @@ using testing::IsEmpty;
 using testing::StartsWith;
 
 // Which lines each request leaves in which log at which level: people and programs filter by them.
-class HVReportingServiceLogTest : public ServiceTest {
+class HVReportingServiceLogTest : public ServiceFixture {
  protected:
   HVReportingServiceLogTest() { platform_.log.clear(); }
   ~HVReportingServiceLogTest() override { platform_.dispatch.clear(); }

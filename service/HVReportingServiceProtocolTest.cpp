@@ -1,6 +1,6 @@
 #include "service/HVReportingServiceProtocol.h"
 
-#include "service/ServiceTest.h"
+#include "service/ServiceFixture.h"
 
 namespace halvox {
 namespace {
@@ -52,7 +52,7 @@ TEST(HVReportingServiceInterfaceTest, ListsTheMethodsWithTheirSignatures) {
   }
 }
 
-class HVReportingServiceProtocolTest : public ServiceTest {
+class HVReportingServiceProtocolTest : public ServiceFixture {
  protected:
   Connection client_ = connect(100);
 };

@@ -1,4 +1,4 @@
-#include "service/DelegateTest.h"
+#include "service/DelegateFixture.h"
 
 namespace halvox {
 namespace {
@@ -25,7 +25,7 @@ class KeepingDelegate final : public TestDelegate {
   Sessions sessions;
 };
 
-class HVReportingStandaloneSessionTest : public DelegateTest<KeepingDelegate> {
+class HVReportingStandaloneSessionTest : public DelegateFixture<KeepingDelegate> {
  protected:
   void sendToNobody(const platform::Message& message = Dictionary{{"a", 1}},
                     AudioEventType type = AudioEventType::kStart) {

@@ -6,7 +6,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "session/LinkTest.h"
+#include "session/LinkFixture.h"
 
 // Who pays for messages that wait to go out over the link.
 namespace halvox::link_test {
@@ -14,7 +14,7 @@ namespace {
 
 using namespace std::chrono_literals;
 
-class HVReportingSessionLinkChargesTest : public LinkTest {
+class HVReportingSessionLinkChargesTest : public LinkFixture {
  protected:
   HVReportingSessionLinkChargesTest() { session_->chargeTo(owner_); }
 

@@ -8,7 +8,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "session/LinkTest.h"
+#include "session/LinkFixture.h"
 
 namespace halvox::link_test {
 namespace {
@@ -19,7 +19,7 @@ using testing::Pair;
 using testing::UnorderedElementsAre;
 using namespace std::chrono_literals;
 
-class HVReportingSessionLinkMessagesTest : public LinkTest {};
+class HVReportingSessionLinkMessagesTest : public LinkFixture {};
 
 // --- messages -----------------------------------------------------------------------------------
 

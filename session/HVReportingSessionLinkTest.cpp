@@ -6,7 +6,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "session/LinkTest.h"
+#include "session/LinkFixture.h"
 
 namespace halvox::link_test {
 namespace {
@@ -15,7 +15,7 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using namespace std::chrono_literals;
 
-class HVReportingSessionLinkTest : public LinkTest {};
+class HVReportingSessionLinkTest : public LinkFixture {};
 
 // --- start --------------------------------------------------------------------------------------
 

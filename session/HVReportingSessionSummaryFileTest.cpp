@@ -6,7 +6,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "session/SummaryTest.h"
+#include "session/SummaryFixture.h"
 
 // The summary files of internal builds. In a program of their own: whether this is an internal
 // build is asked once a process.
@@ -23,7 +23,7 @@ const std::string kDirectory =
     "/private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
 const std::string kName = "20231114-221320+0000-halvox-Unknown-haptics.json";
 
-class HVReportingSessionSummaryFileTest : public SummaryTest {
+class HVReportingSessionSummaryFileTest : public SummaryFixture {
  protected:
   HVReportingSessionSummaryFileTest() { platform_.deviceProperties.set("InternalBuild", true); }
 

@@ -8,7 +8,7 @@
 
 #include "platform/fake/FakePlatform.h"
 #include "session/HVReportingSession.h"
-#include "session/SummaryTest.h"
+#include "session/SummaryFixture.h"
 
 namespace halvox {
 namespace {
@@ -20,7 +20,7 @@ using platform::Value;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-class HVReportingSessionSummaryTest : public SummaryTest {};
+class HVReportingSessionSummaryTest : public SummaryFixture {};
 
 // --- the summary event --------------------------------------------------------------------------
 

@@ -9,7 +9,7 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 
 namespace halvox::tools {
 namespace {

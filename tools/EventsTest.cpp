@@ -13,7 +13,7 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/store/SqliteAnalyticsService.h"

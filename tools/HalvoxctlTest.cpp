@@ -11,7 +11,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/diagnostics/SnapshotArchive.h"

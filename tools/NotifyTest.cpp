@@ -7,7 +7,7 @@
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 
 namespace halvox::tools {
 namespace {

@@ -6,7 +6,7 @@
 
 #include <gtest/gtest.h>
 
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 #include "tools/CommandLine.h"
 
 namespace halvox::tools {

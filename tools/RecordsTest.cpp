@@ -9,7 +9,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/store/SqliteMetricService.h"
 #include "platform/linux/store/SqliteStore.h"

@@ -5,7 +5,7 @@
 
 #include <gtest/gtest.h>
 
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 
 namespace halvox::tools {
 namespace {

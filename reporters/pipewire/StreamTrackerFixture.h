@@ -18,9 +18,9 @@ inline constexpr std::uint32_t kCookie = 0xABCD1234;
 inline constexpr std::uint64_t kSerial = 55;
 
 // A fixture with a tracker that knows two devices, and a client that records its operations.
-class StreamTrackerTest : public testing::Test {
+class StreamTrackerFixture : public testing::Test {
  protected:
-  StreamTrackerTest() {
+  StreamTrackerFixture() {
     tracker.serverConnected(kCookie);
     addDevice(kSpeakers, "speakers", "Speakers");
     addDevice(kHeadphones, "headphones", "Headphones");

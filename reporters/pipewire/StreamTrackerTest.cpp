@@ -14,6 +14,8 @@ namespace {
 using testing::ElementsAre;
 using testing::IsEmpty;
 
+class StreamTrackerTest : public StreamTrackerFixture {};
+
 TEST(ReporterIDTest, HoldsNamespaceCookieAndSerial) {
   EXPECT_EQ(reporterIDFor(0xABCD1234, 0x55), 0x5057'1234'0000'0055);
   EXPECT_GT(reporterIDFor(0xFFFFFFFF, 0xFFFFFFFFFFFFFFFF), 0);

@@ -11,7 +11,7 @@ namespace {
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-class StreamTrackerXrunTest : public StreamTrackerTest {
+class StreamTrackerXrunTest : public StreamTrackerFixture {
  protected:
   using Milliseconds = std::chrono::milliseconds;
 

@@ -62,7 +62,7 @@ def allowed_folders(path: str) -> set[str]:
 
 
 def is_test(path: str) -> bool:
-    return bool(re.search(r"(Test|_test|TestSupport)\.(cpp|h)$", path))
+    return bool(re.search(r"(Test|_test|Fixture)\.(cpp|h)$", path))
 
 
 def breaches_of(path: str):

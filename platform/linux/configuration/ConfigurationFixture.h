@@ -26,7 +26,7 @@ inline constexpr const char* kVariables[] = {"HALVOX_CONFIG",
                                              "HOME"};
 
 // A scratch directory as home, and no other variable set that the configuration looks at.
-class ConfigurationTest : public ::testing::Test {
+class ConfigurationFixture : public ::testing::Test {
  protected:
   void SetUp() override {
     for (const char* variable : kVariables) {

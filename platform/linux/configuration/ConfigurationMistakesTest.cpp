@@ -17,15 +17,15 @@ struct MistakeCase {
   const char* mistake;
 };
 
-class ConfigurationMistakeTest : public ConfigurationTest,
-                                 public ::testing::WithParamInterface<MistakeCase> {};
+class ConfigurationMistakesTest : public ConfigurationFixture,
+                                  public ::testing::WithParamInterface<MistakeCase> {};
 
-TEST_P(ConfigurationMistakeTest, IsToldWithItsPlace) {
+TEST_P(ConfigurationMistakesTest, IsToldWithItsPlace) {
   EXPECT_EQ(mistake(GetParam().text), GetParam().mistake);
 }
 
 INSTANTIATE_TEST_SUITE_P(
-    Mistakes, ConfigurationMistakeTest,
+    Mistakes, ConfigurationMistakesTest,
     ::testing::Values(
         MistakeCase{"WrongType", "[listener]\nsocket = 3",
                     "2:10: listener.socket: expected an absolute path, found 3"},
@@ -130,7 +130,7 @@ INSTANTIATE_TEST_SUITE_P(
                     "0"}),
     [](const auto& test) { return std::string(test.param.name); });
 
-TEST_F(ConfigurationTest, SocketPathMustFitIntoAnAddress) {
+TEST_F(ConfigurationMistakesTest, SocketPathMustFitIntoAnAddress) {
   const std::string longest = "/" + std::string(106, 'x');
 
   EXPECT_EQ(loaded("listener.socket = \"" + longest + "\"").listener.socket, longest);
@@ -139,7 +139,7 @@ TEST_F(ConfigurationTest, SocketPathMustFitIntoAnAddress) {
 }
 
 // Walking through as many tables as such a key makes would end the process.
-TEST_F(ConfigurationTest, KeyOfManyWordsIsToldWithItsLine) {
+TEST_F(ConfigurationMistakesTest, KeyOfManyWordsIsToldWithItsLine) {
   std::string key = "a";
   for (int count = 1; count < 100'000; ++count) key += ".a";
 
@@ -149,30 +149,30 @@ TEST_F(ConfigurationTest, KeyOfManyWordsIsToldWithItsLine) {
   }
 }
 
-TEST_F(ConfigurationTest, SyntaxErrorIsToldWithItsPlace) {
+TEST_F(ConfigurationMistakesTest, SyntaxErrorIsToldWithItsPlace) {
   EXPECT_THAT(mistake("[listener]\nsocket = = 3\n"),
               StartsWith("2:10: the file: expected TOML, found a mistake: "));
 }
 
-TEST_F(ConfigurationTest, TextThatIsNotUtf8IsAMistake) {
+TEST_F(ConfigurationMistakesTest, TextThatIsNotUtf8IsAMistake) {
   // The place is that of the last character before it.
   EXPECT_THAT(mistake("[listener]\nsocket = \"/\xFF\"\n"),
               StartsWith("2:11: the file: expected TOML, found a mistake: "));
 }
 
-TEST_F(ConfigurationTest, LargeFileIsRefused) {
+TEST_F(ConfigurationMistakesTest, LargeFileIsRefused) {
   EXPECT_EQ(mistake("#" + std::string(1U << 20U, 'x')),
             "1:1: the file: expected at most 1048576 bytes, found more");
   loaded("#" + std::string((1U << 20U) - 1, 'x'));
 }
 
-TEST_F(ConfigurationTest, MistakeStaysOnOneLine) {
+TEST_F(ConfigurationMistakesTest, MistakeStaysOnOneLine) {
   const std::string text = mistake("\"a\\nb\\u001b\" = 1");
 
   EXPECT_THAT(text, StartsWith("1:1: a\\nb\\x1b: expected a known key"));
 }
 
-TEST_F(ConfigurationTest, NamedFileMustExist) {
+TEST_F(ConfigurationMistakesTest, NamedFileMustExist) {
   ::setenv("HALVOX_CONFIG", (directory_ / "none.toml").c_str(), 1);
 
   const auto result = loadConfiguration();
@@ -185,7 +185,7 @@ TEST_F(ConfigurationTest, NamedFileMustExist) {
                 ": the configuration cannot be read: No such file or directory");
 }
 
-TEST_F(ConfigurationTest, DirectoryCannotBeRead) {
+TEST_F(ConfigurationMistakesTest, DirectoryCannotBeRead) {
   ::setenv("HALVOX_CONFIG", directory_.c_str(), 1);
 
   const auto result = loadConfiguration();
@@ -196,7 +196,7 @@ TEST_F(ConfigurationTest, DirectoryCannotBeRead) {
   EXPECT_THAT(error->description, EndsWith("Is a directory"));
 }
 
-TEST_F(ConfigurationTest, PipeThatNobodyWritesToDoesNotHoldUpTheStart) {
+TEST_F(ConfigurationMistakesTest, PipeThatNobodyWritesToDoesNotHoldUpTheStart) {
   const auto pipe = directory_ / "pipe";
   ASSERT_EQ(::mkfifo(pipe.c_str(), 0600), 0);
   ::setenv("HALVOX_CONFIG", pipe.c_str(), 1);

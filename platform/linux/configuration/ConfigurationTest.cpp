@@ -5,6 +5,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
+class ConfigurationTest : public ConfigurationFixture {};
+
 TEST_F(ConfigurationTest, MissingFileMeansDefaults) {
   if (std::filesystem::exists("/etc/halvox/halvox.toml")) GTEST_SKIP() << "this system has one";
   const auto result = loadConfiguration();

@@ -4,17 +4,17 @@
 
 #include <chrono>
 
-#include "platform/linux/diagnostics/SnapshotTestSupport.h"
+#include "platform/linux/diagnostics/SnapshotFixture.h"
 
 namespace halvox::platform::contract {
 namespace {
 
 // A service on fakes in a scratch directory.
-class SnapshotHarness : private linux_::SnapshotTest {
+class SnapshotHarness : private linux_::SnapshotFixture {
  public:
   SnapshotHarness() { start(); }
 
-  DiagnosticReporterService& service() { return *SnapshotTest::service; }
+  DiagnosticReporterService& service() { return *SnapshotFixture::service; }
   bool letReply(const std::function<bool()>& condition) {
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
     while (!condition()) {
@@ -24,7 +24,7 @@ class SnapshotHarness : private linux_::SnapshotTest {
     }
     return true;
   }
-  void end() { SnapshotTest::service->stop(); }
+  void end() { SnapshotFixture::service->stop(); }
 
  private:
   void TestBody() override {}

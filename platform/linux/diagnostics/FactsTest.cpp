@@ -2,7 +2,7 @@
 
 #include "platform/linux/diagnostics/FileTree.h"
 #include "platform/linux/diagnostics/ProcessFacts.h"
-#include "platform/linux/diagnostics/SnapshotTestSupport.h"
+#include "platform/linux/diagnostics/SnapshotFixture.h"
 
 // Tests of processFacts() and readTree().
 

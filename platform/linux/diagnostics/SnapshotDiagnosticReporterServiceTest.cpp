@@ -5,7 +5,7 @@
 
 #include <sys/stat.h>
 
-#include "platform/linux/diagnostics/SnapshotTestSupport.h"
+#include "platform/linux/diagnostics/SnapshotFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -23,9 +23,9 @@ using ::testing::SizeIs;
 // 2026-03-01 12:00:00 UTC
 constexpr double kNoon = 1'772'366'400;
 
-class SnapshotServiceTest : public SnapshotTest {
+class SnapshotDiagnosticReporterServiceTest : public SnapshotFixture {
  protected:
-  SnapshotServiceTest() { platform.clock.setCurrentDate({kNoon}); }
+  SnapshotDiagnosticReporterServiceTest() { platform.clock.setCurrentDate({kNoon}); }
 
   // A state source that answers only when the test says so.
   void holdState() {
@@ -41,7 +41,7 @@ class SnapshotServiceTest : public SnapshotTest {
   std::promise<std::function<void(const Dictionary&)>> asked_;
 };
 
-TEST_F(SnapshotServiceTest, SignatureHasItsFieldsAndValuesOnlyWhenThereAreAny) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, SignatureHasItsFieldsAndValuesOnlyWhenThereAreAny) {
   start();
   const auto reporter = service->createReporter();
 
@@ -57,7 +57,7 @@ TEST_F(SnapshotServiceTest, SignatureHasItsFieldsAndValuesOnlyWhenThereAreAny) {
   EXPECT_EQ(reporter->makeSignature("a", "b", "c", "d", "e", Dictionary{{"x", 1}}), withValues);
 }
 
-TEST_F(SnapshotServiceTest, ResponseNamesTheFileByTimeTypeAndSubType) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, ResponseNamesTheFileByTimeTypeAndSubType) {
   start();
 
   const Dictionary response = snapshot();
@@ -69,7 +69,7 @@ TEST_F(SnapshotServiceTest, ResponseNamesTheFileByTimeTypeAndSubType) {
   EXPECT_FALSE(response.contains("error"));
 }
 
-TEST_F(SnapshotServiceTest, ArchiveIsForItsOwnerAloneAndNothingElseIsLeft) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, ArchiveIsForItsOwnerAloneAndNothingElseIsLeft) {
   start();
 
   const std::string file = textOf(snapshot(), "path");
@@ -80,7 +80,7 @@ TEST_F(SnapshotServiceTest, ArchiveIsForItsOwnerAloneAndNothingElseIsLeft) {
   EXPECT_THAT(names(), SizeIs(1));
 }
 
-TEST_F(SnapshotServiceTest, ArchiveHasThePartsAndNamesTheMissingOnes) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, ArchiveHasThePartsAndNamesTheMissingOnes) {
   log = [] { return LogMemory::Contents{.text = "a line\n", .lines = 1, .added = 1}; };
   writeText(options.paths.alsa / "cards", "0 [Dummy]\n");
   writeText(options.paths.alsa / "version", "Driver Version k1\n");
@@ -105,7 +105,7 @@ TEST_F(SnapshotServiceTest, ArchiveHasThePartsAndNamesTheMissingOnes) {
                                             HasSubstr(R"("name":"log.txt")")));
 }
 
-TEST_F(SnapshotServiceTest, EventAndPayloadOfTheRequestAreInTheArchive) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, EventAndPayloadOfTheRequestAreInTheArchive) {
   start();
   std::promise<Dictionary> response;
 
@@ -119,7 +119,7 @@ TEST_F(SnapshotServiceTest, EventAndPayloadOfTheRequestAreInTheArchive) {
             "{\"duration_seconds\":1.5,\"event\":{\"e\":1},\"payload\":{\"p\":2}}\n");
 }
 
-TEST_F(SnapshotServiceTest, RequestDuringAnotherIsRefusedAtOnceAndCounted) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, RequestDuringAnotherIsRefusedAtOnceAndCounted) {
   start();
   holdState();
   auto first = request();
@@ -136,7 +136,7 @@ TEST_F(SnapshotServiceTest, RequestDuringAnotherIsRefusedAtOnceAndCounted) {
   expectBalance();
 }
 
-TEST_F(SnapshotServiceTest, ReplyMayAskForTheNextSnapshot) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, ReplyMayAskForTheNextSnapshot) {
   start();
   std::promise<Dictionary> second;
   const auto reporter = service->createReporter();
@@ -149,7 +149,7 @@ TEST_F(SnapshotServiceTest, ReplyMayAskForTheNextSnapshot) {
   EXPECT_THAT(textOf(responseOf(second.get_future()), "path"), HasSubstr("20260301T120000Z-2-"));
 }
 
-TEST_F(SnapshotServiceTest, OnlyTheNewestAreKept) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, OnlyTheNewestAreKept) {
   options.keep = 3;
   start();
   std::vector<std::string> all;
@@ -162,7 +162,7 @@ TEST_F(SnapshotServiceTest, OnlyTheNewestAreKept) {
   EXPECT_THAT(names(), ElementsAre(all[2], all[3], all[4]));
 }
 
-TEST_F(SnapshotServiceTest, MissingStateCostsABoundedTimeAndIsNamed) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, MissingStateCostsABoundedTimeAndIsNamed) {
   options.stateWithin = std::chrono::milliseconds(50);
   start();
   service->setStateSource([](const auto&) {});
@@ -173,7 +173,7 @@ TEST_F(SnapshotServiceTest, MissingStateCostsABoundedTimeAndIsNamed) {
   EXPECT_THAT(files["manifest.json"], HasSubstr("the service did not answer in time"));
 }
 
-TEST_F(SnapshotServiceTest, SlowProgramsCostABoundedTime) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, SlowProgramsCostABoundedTime) {
   options.dumpWithin = std::chrono::milliseconds(100);
   options.paths.pipeWireDump = {"sleep", "60"};
   start();
@@ -185,7 +185,7 @@ TEST_F(SnapshotServiceTest, SlowProgramsCostABoundedTime) {
   EXPECT_THAT(files["manifest.json"], HasSubstr("sleep: did not end in time"));
 }
 
-TEST_F(SnapshotServiceTest, PartsBeyondTheSizeLimitAreOmitted) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, PartsBeyondTheSizeLimitAreOmitted) {
   options.mostBytes = (1U << 20U) + 4000;  // of which 1 MiB is reserved for the manifest
   log = [] { return LogMemory::Contents{.text = std::string(5000, 'x'), .lines = 1, .added = 1}; };
   start();
@@ -196,7 +196,7 @@ TEST_F(SnapshotServiceTest, PartsBeyondTheSizeLimitAreOmitted) {
   EXPECT_THAT(files["manifest.json"], HasSubstr("the size limit of the archive was reached"));
 }
 
-TEST_F(SnapshotServiceTest, EachSnapshotIsRecordedOnce) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, EachSnapshotIsRecordedOnce) {
   struct : SnapshotRecorder {
     void recordSnapshot(Date time, const Dictionary& signature,
                         const std::filesystem::path& path) override {
@@ -217,7 +217,7 @@ TEST_F(SnapshotServiceTest, EachSnapshotIsRecordedOnce) {
   EXPECT_EQ(counted("delivered"), 1U);
 }
 
-TEST_F(SnapshotServiceTest, StopDuringASnapshotAnswersAndLeavesNoFile) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, StopDuringASnapshotAnswersAndLeavesNoFile) {
   options.stateWithin = std::chrono::seconds(60);
   options.collectWithin = std::chrono::seconds(60);
   start();
@@ -235,7 +235,7 @@ TEST_F(SnapshotServiceTest, StopDuringASnapshotAnswersAndLeavesNoFile) {
   expectBalance();
 }
 
-TEST_F(SnapshotServiceTest, StopKillsAProgramThatRuns) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, StopKillsAProgramThatRuns) {
   options.dumpWithin = std::chrono::seconds(60);
   options.collectWithin = std::chrono::seconds(60);
   const std::filesystem::path pipe = scratch.path() / "running";
@@ -251,7 +251,7 @@ TEST_F(SnapshotServiceTest, StopKillsAProgramThatRuns) {
   EXPECT_THAT(names(), IsEmpty());
 }
 
-TEST_F(SnapshotServiceTest, RequestAfterTheStopIsRefused) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, RequestAfterTheStopIsRefused) {
   start();
   service->stop();
 
@@ -262,7 +262,7 @@ TEST_F(SnapshotServiceTest, RequestAfterTheStopIsRefused) {
   expectBalance();
 }
 
-TEST_F(SnapshotServiceTest, RequestsOfManyThreadsAreAllAnswered) {
+TEST_F(SnapshotDiagnosticReporterServiceTest, RequestsOfManyThreadsAreAllAnswered) {
   start();
   std::vector<std::future<Dictionary>> responses(40);
   std::vector<std::thread> threads;

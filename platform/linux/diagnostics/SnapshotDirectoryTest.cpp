@@ -1,6 +1,6 @@
 #include "platform/linux/diagnostics/SnapshotDirectory.h"
 
-#include "platform/linux/diagnostics/SnapshotTestSupport.h"
+#include "platform/linux/diagnostics/SnapshotFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {

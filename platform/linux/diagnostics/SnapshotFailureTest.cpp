@@ -1,7 +1,7 @@
 #include <sched.h>
 #include <sys/mount.h>
 
-#include "platform/linux/diagnostics/SnapshotTestSupport.h"
+#include "platform/linux/diagnostics/SnapshotFixture.h"
 #include "platform/linux/testing/FileSizeLimit.h"
 
 // What happens to snapshots when the disk refuses them.
@@ -14,7 +14,7 @@ using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 using ::testing::SizeIs;
 
-class SnapshotFailureTest : public SnapshotTest {
+class SnapshotFailureTest : public SnapshotFixture {
  protected:
   SnapshotFailureTest() {
     // Text that does not compress, so that the archive needs the disk.

@@ -2,7 +2,7 @@
 
 #include <sys/stat.h>
 
-#include "platform/linux/diagnostics/SnapshotTestSupport.h"
+#include "platform/linux/diagnostics/SnapshotFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {

@@ -3,7 +3,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/drivers/testing/MadeReadings.h"
 
 namespace halvox::platform::linux_ {
 namespace {

@@ -8,9 +8,9 @@
 
 #include "platform/fake/FakePlatform.h"
 #include "platform/fake/contracts/IOReportContract.h"
-#include "platform/linux/drivers/DriverTesting.h"
 #include "platform/linux/drivers/LinuxIOReportService.h"
 #include "platform/linux/drivers/ReadingMaker.h"
+#include "platform/linux/drivers/testing/MadeReadings.h"
 
 namespace halvox::platform::linux_ {
 namespace {

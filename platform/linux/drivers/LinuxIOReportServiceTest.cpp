@@ -10,7 +10,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/fake/FakePlatform.h"
-#include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/drivers/testing/MadeReadings.h"
 
 namespace halvox::platform::linux_ {
 namespace {

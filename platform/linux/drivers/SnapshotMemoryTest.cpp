@@ -1,7 +1,7 @@
 #include <gtest/gtest.h>
 
-#include "platform/linux/drivers/DriverTesting.h"
 #include "platform/linux/drivers/ReadingMaker.h"
+#include "platform/linux/drivers/testing/MadeReadings.h"
 
 // What a session's snapshot holds.
 namespace halvox::platform::linux_ {

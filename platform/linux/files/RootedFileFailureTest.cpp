@@ -15,7 +15,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "platform/linux/files/FilesTestSupport.h"
+#include "platform/linux/files/FilesFixture.h"
 #include "platform/linux/files/UnfinishedFile.h"
 
 namespace halvox::platform::linux_ {
@@ -28,7 +28,7 @@ using testing::IsEmpty;
 
 constexpr uid_t kNobody = 65534;
 
-class RootedFileFailureTest : public FilesTest {
+class RootedFileFailureTest : public FilesFixture {
  protected:
   RootedFileFailureTest() { fs::create_directories(root_ / "a"); }
   ~RootedFileFailureTest() override {

@@ -11,7 +11,7 @@
 #include <sys/resource.h>
 #include <sys/stat.h>
 
-#include "platform/linux/files/FilesTestSupport.h"
+#include "platform/linux/files/FilesFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -21,7 +21,7 @@ using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-class RootedFileServiceTest : public FilesTest {
+class RootedFileServiceTest : public FilesFixture {
  protected:
   static fs::perms permissionsOf(const fs::path& path) { return fs::status(path).permissions(); }
 };

@@ -4,7 +4,7 @@
 #include <gmock/gmock.h>
 #include <sys/stat.h>
 
-#include "platform/linux/settings/SettingsTestSupport.h"
+#include "platform/linux/settings/SettingsFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -14,7 +14,7 @@ constexpr const char* kDomain = "org.example";
 // Posting this name shows that all earlier changes have been handled.
 constexpr const char* kSentinel = "sentinel";
 
-class InotifyNotifyServiceTest : public SettingsTest {
+class InotifyNotifyServiceTest : public SettingsFixture {
  protected:
   ~InotifyNotifyServiceTest() override { service_.stop(); }
 

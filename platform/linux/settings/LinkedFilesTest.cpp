@@ -2,7 +2,7 @@
 
 #include <gmock/gmock.h>
 
-#include "platform/linux/settings/SettingsTestSupport.h"
+#include "platform/linux/settings/SettingsFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -10,7 +10,7 @@ namespace {
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-class LinkedFilesTest : public SettingsTest {
+class LinkedFilesTest : public SettingsFixture {
  protected:
   LinkedFilesTest() { scratch_ = std::filesystem::canonical(scratch_); }
 };

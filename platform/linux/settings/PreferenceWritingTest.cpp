@@ -5,13 +5,13 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include "platform/linux/settings/SettingsTestSupport.h"
+#include "platform/linux/settings/SettingsFixture.h"
 #include "platform/linux/testing/FileSizeLimit.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
-class PreferenceWritingTest : public SettingsTest {
+class PreferenceWritingTest : public SettingsFixture {
  protected:
   static PreferenceEdit to(std::string text) {
     return [text = std::move(text)](std::string_view, const std::filesystem::path&) {

@@ -5,7 +5,7 @@
 #include <time.h>
 
 #include "platform/linux/settings/PreferenceFile.h"
-#include "platform/linux/settings/SettingsTestSupport.h"
+#include "platform/linux/settings/SettingsFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -13,7 +13,7 @@ namespace {
 using testing::Pair;
 using testing::UnorderedElementsAre;
 
-class TomlPreferenceServiceTest : public SettingsTest {
+class TomlPreferenceServiceTest : public SettingsFixture {
  protected:
   std::optional<Value> at(std::string_view key, std::string_view domain = "domain",
                           std::string_view user = "mobile") const {

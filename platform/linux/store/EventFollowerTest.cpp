@@ -5,7 +5,7 @@
 
 #include <poll.h>
 
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -13,7 +13,7 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
-class EventFollowerTest : public StoreTest {
+class EventFollowerTest : public StoreFixture {
  protected:
   // Delivers until `count` events were seen in all. Returns false after ten seconds.
   bool follow(std::size_t count) {

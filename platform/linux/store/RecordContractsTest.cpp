@@ -11,7 +11,7 @@
 #include "platform/linux/store/SqliteAnalyticsService.h"
 #include "platform/linux/store/SqliteMetricService.h"
 #include "platform/linux/store/SqlitePowerLogService.h"
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 
 namespace halvox::platform::contract {
 namespace {

@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -13,7 +13,7 @@ using ::testing::SizeIs;
 constexpr double kDay = 86'400;
 constexpr double kNow = 1'700'000'000;
 
-class RetentionTest : public StoreTest {
+class RetentionTest : public StoreFixture {
  protected:
   void sendAt(double time, std::int64_t number) {
     platform.clock.setCurrentDate({time});

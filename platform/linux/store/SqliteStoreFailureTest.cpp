@@ -1,6 +1,6 @@
 #include <string>
 
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/testing/FileSizeLimit.h"
 
 // What the store does when something happens to its file while it runs.
@@ -16,7 +16,7 @@ using ::testing::IsEmpty;
 using ::testing::Not;
 using ::testing::SizeIs;
 
-class SqliteStoreFailureTest : public StoreTest {
+class SqliteStoreFailureTest : public StoreFixture {
  protected:
   // Sends events until one is stored. Returns false after ten seconds.
   bool storesAgain() {

@@ -7,7 +7,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 
 // What remains of a store whose process was killed under load.
 
@@ -25,7 +25,7 @@ struct Progress {
   Clock::time_point times[kMostEvents];  // when each send() returned
 };
 
-class SqliteStoreKillTest : public StoreTest {
+class SqliteStoreKillTest : public StoreFixture {
  protected:
   SqliteStoreKillTest() {
     void* memory = ::mmap(nullptr, sizeof(Progress), PROT_READ | PROT_WRITE,

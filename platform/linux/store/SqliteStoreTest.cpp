@@ -8,7 +8,7 @@
 
 #include <sys/stat.h>
 
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -16,7 +16,7 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 
-using SqliteStoreTest = StoreTest;
+class SqliteStoreTest : public StoreFixture {};
 
 TEST_F(SqliteStoreTest, StoresTimeNameAndPayloadInTheOrderOfSending) {
   start();

@@ -4,7 +4,7 @@
 #include <functional>
 #include <string>
 
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/testing/NoThreadsToHave.h"
 
 // What the store does with a database that the last run did not close.
@@ -22,7 +22,7 @@ using ::testing::SizeIs;
 
 constexpr std::int64_t kEvents = 4000;
 
-class StoreCheckTest : public StoreTest {
+class StoreCheckTest : public StoreFixture {
  protected:
   // Leaves the files of a run that stored events and was then killed.
   void leaveKilledStore() {

@@ -2,8 +2,8 @@
 
 #include <string>
 
+#include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/store/StoreSchema.h"
-#include "platform/linux/store/StoreTestSupport.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -12,7 +12,7 @@ using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
 // A fixture with a database of 1,000 events. The extent was taken after the first 600.
-class StoreExtentTest : public StoreTest {
+class StoreExtentTest : public StoreFixture {
  protected:
   StoreExtentTest() {
     start();

@@ -2,8 +2,8 @@
 
 #include <string>
 
+#include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/store/StoreSchema.h"
-#include "platform/linux/store/StoreTestSupport.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -13,7 +13,7 @@ using ::testing::HasSubstr;
 using ::testing::IsEmpty;
 using ::testing::SizeIs;
 
-class StoreOpeningTest : public StoreTest {
+class StoreOpeningTest : public StoreFixture {
  protected:
   // Makes a store with 4,000 events and closes it in good order.
   void makeStore() {

@@ -5,7 +5,7 @@
 
 #include <sys/stat.h>
 
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -14,7 +14,7 @@ using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using ::testing::SizeIs;
 
-class StoreReaderTest : public StoreTest {
+class StoreReaderTest : public StoreFixture {
  protected:
   // Stores events 0 to count - 1, one second apart from time 1,000, named "even" and "odd".
   void store1000(std::int64_t count) {

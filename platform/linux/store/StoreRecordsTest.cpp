@@ -6,9 +6,9 @@
 #include "platform/linux/store/EventFollower.h"
 #include "platform/linux/store/SqliteMetricService.h"
 #include "platform/linux/store/SqlitePowerLogService.h"
+#include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/store/StoreReader.h"
 #include "platform/linux/store/StoreSchema.h"
-#include "platform/linux/store/StoreTestSupport.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -36,7 +36,7 @@ class NoField final : public ProtoBase {
   void formatText(ProtoTextFormatter& /*formatter*/, const char* /*name*/) const override {}
 };
 
-class StoreRecordsTest : public StoreTest {
+class StoreRecordsTest : public StoreFixture {
  protected:
   StoreRecordsTest() { platform.clock.setCurrentDate({kNow}); }
 

@@ -11,7 +11,7 @@ from dataclasses import dataclass
 
 from .mutants import mutants_of
 
-_TEST_FILE = re.compile(r"(Test|Fixture)\.(h|cpp)$")
+_TEST_FILE = re.compile(r"(Test|_test|Fixture)\.(h|cpp)$")
 # Makes the objects and runs them; nothing of it is linked into a unit test.
 _COMPOSITION_ROOT = "service/main.cpp"
 

@@ -5,7 +5,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/drivers/testing/MadeReadings.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {

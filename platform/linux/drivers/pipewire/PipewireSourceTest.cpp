@@ -12,7 +12,7 @@
 #include <stdlib.h>
 
 #include "platform/fake/FakePlatform.h"
-#include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/drivers/testing/MadeReadings.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 #include "reporters/pipewire/PrivatePipeWire.h"
 

@@ -7,7 +7,7 @@
 #include <gtest/gtest.h>
 #include <stdlib.h>
 
-#include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/drivers/testing/MadeReadings.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {

@@ -8,7 +8,7 @@
 #include <unistd.h>
 
 #include "platform/fake/FakePlatform.h"
-#include "platform/linux/drivers/DriverTesting.h"
+#include "platform/linux/drivers/testing/MadeReadings.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {

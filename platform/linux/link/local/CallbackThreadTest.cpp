@@ -9,7 +9,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/fake/FakePlatform.h"
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/testing/NoThreadsToHave.h"
 
 namespace halvox::platform::linux_ {

@@ -4,14 +4,14 @@
 #include <thread>
 #include <vector>
 
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
 using ::testing::ElementsAre;
 
-class LocalTlmReportingServiceTest : public StoreTest {
+class LocalTlmReportingServiceTest : public StoreFixture {
  protected:
   LocalTlmReportingServiceTest() { platform.clock.setCurrentDate({1'700'000'000.5}); }
 

@@ -9,12 +9,12 @@
 #include "platform/linux/link/local/CallbackThread.h"
 #include "platform/linux/link/local/LocalTlmReportingService.h"
 #include "platform/linux/link/local/NoneTlmReportingService.h"
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 
 namespace halvox::platform::contract {
 namespace {
 
-class LocalHarness : private linux_::StoreTest {
+class LocalHarness : private linux_::StoreFixture {
  public:
   static constexpr bool kFindsBackends = true;
   static constexpr bool kTakesMessages = true;

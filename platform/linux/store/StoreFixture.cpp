@@ -1,4 +1,4 @@
-#include "platform/linux/store/StoreTestSupport.h"
+#include "platform/linux/store/StoreFixture.h"
 
 #include <algorithm>
 #include <fstream>
@@ -56,7 +56,7 @@ void writeFile(const std::filesystem::path& path, std::string_view content) {
   stream << content;
 }
 
-std::optional<StoreError> StoreTest::open() {
+std::optional<StoreError> StoreFixture::open() {
   service.reset();
   store.reset();
   store = std::make_unique<SqliteStore>(
@@ -65,15 +65,15 @@ std::optional<StoreError> StoreTest::open() {
   return store->open();
 }
 
-void StoreTest::send(std::int64_t number, const std::string& name) {
+void StoreFixture::send(std::int64_t number, const std::string& name) {
   service->sendAnalyticsEventLazy(name, [number] { return Dictionary{{"number", number}}; });
 }
 
-bool StoreTest::allIsStored() {
+bool StoreFixture::allIsStored() {
   return eventually([this] { return store->waiting() == 0; });
 }
 
-std::vector<std::filesystem::path> StoreTest::setAsideFiles() const {
+std::vector<std::filesystem::path> StoreFixture::setAsideFiles() const {
   std::vector<std::filesystem::path> found;
   for (const auto& entry : std::filesystem::directory_iterator(options.directory)) {
     if (entry.path().filename().native().starts_with("halvox.db.damaged-")) {
@@ -84,7 +84,7 @@ std::vector<std::filesystem::path> StoreTest::setAsideFiles() const {
   return found;
 }
 
-std::uint64_t StoreTest::dropped() const {
+std::uint64_t StoreFixture::dropped() const {
   std::uint64_t sum = 0;
   for (const auto& [name, count] : platform.statistics.values("analytics")) {
     if (name.starts_with("dropped")) sum += count;

@@ -38,9 +38,9 @@ inline Channel simpleChannel(std::string name, std::int64_t value) {
 }
 
 // Has a session that is started, and no channels yet.
-class DriverUtilityTest : public testing::Test {
+class DriverUtilityFixture : public testing::Test {
  protected:
-  DriverUtilityTest() {
+  DriverUtilityFixture() {
     session_->setServiceType(AudioServiceType::kHaptics);
     session_->start();
     forgetWhatHappened();

@@ -33,9 +33,9 @@ void writeArchive(const std::filesystem::path& file, const std::vector<TestEntry
 
 // A fixture with a service on fake platform services, in a scratch directory, and with paths of its
 // own in place of /proc and the others.
-class SnapshotTest : public ::testing::Test {
+class SnapshotFixture : public ::testing::Test {
  protected:
-  SnapshotTest();
+  SnapshotFixture();
 
   void start() {
     service = std::make_unique<SnapshotDiagnosticReporterService>(

@@ -1,4 +1,4 @@
-#include "client/TestService.h"
+#include "client/testing/TestService.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -48,10 +48,10 @@ class TestDelegate : public HVReportingServiceDelegateProtocol {
 
 // One client object of such a service.
 template <typename Delegate>
-class DelegateTest : public testing::Test {
+class DelegateFixture : public testing::Test {
  protected:
-  DelegateTest() { createReportingQueue(); }
-  ~DelegateTest() override { platform_.dispatch.clear(); }
+  DelegateFixture() { createReportingQueue(); }
+  ~DelegateFixture() override { platform_.dispatch.clear(); }
 
   void run() { platform_.dispatch.runUntilIdle(); }
 

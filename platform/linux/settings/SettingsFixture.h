@@ -16,7 +16,7 @@
 namespace halvox::platform::linux_ {
 
 // A fixture with directories for preferences and notifications. Neither exists at first.
-class SettingsTest : public testing::Test {
+class SettingsFixture : public testing::Test {
  protected:
   [[nodiscard]] std::filesystem::path preferences() const { return scratch_ / "preferences"; }
   [[nodiscard]] std::filesystem::path notify() const { return scratch_ / "notify"; }

@@ -16,12 +16,12 @@ namespace halvox {
 
 // A service on fakes and the ways in which its tests play clients. Requests are carried out before
 // the functions return, except with `post`.
-class ServiceTest : public testing::Test {
+class ServiceFixture : public testing::Test {
  protected:
   using Connection = std::shared_ptr<platform::FakeConnection>;
   using Call = std::shared_ptr<platform::FakeCall>;
 
-  ServiceTest() {
+  ServiceFixture() {
     platform_.connections.serviceListener().setDelegate(*delegate_);
     forgetSteps();  // those of making the delegate
   }

@@ -31,9 +31,9 @@ void writeFile(const std::filesystem::path& path, std::string_view content);
 
 // A fixture with a store in a scratch directory, fake platform services, and a service that sends
 // events to the store.
-class StoreTest : public ::testing::Test {
+class StoreFixture : public ::testing::Test {
  protected:
-  StoreTest() { options.directory = scratch.path() / "state" / "halvox"; }
+  StoreFixture() { options.directory = scratch.path() / "state" / "halvox"; }
 
   // Makes a store with `options` and opens it.
   [[nodiscard]] std::optional<StoreError> open();

@@ -10,9 +10,9 @@
 namespace halvox {
 
 // A started session that can be stopped, without the link.
-class SummaryTest : public testing::Test {
+class SummaryFixture : public testing::Test {
  protected:
-  SummaryTest() {
+  SummaryFixture() {
     session_->setServiceType(AudioServiceType::kHaptics);
     session_->start();
   }

@@ -43,9 +43,9 @@ inline const std::string kMessageEntered =
 
 // A session with the link enabled that is not started yet. What is submitted runs when told, or
 // before start(), stop() and open() return.
-class LinkTest : public testing::Test {
+class LinkFixture : public testing::Test {
  protected:
-  LinkTest() {
+  LinkFixture() {
     session_->setServiceType(AudioServiceType::kHaptics);
     session_->setTlmReportingEnabled(true);
   }

@@ -1,4 +1,4 @@
-#include "platform/linux/diagnostics/SnapshotTestSupport.h"
+#include "platform/linux/diagnostics/SnapshotFixture.h"
 
 #include <algorithm>
 #include <array>
@@ -73,7 +73,7 @@ void writeArchive(const fs::path& file, const std::vector<TestEntry>& entries) {
   ASSERT_EQ(archive_write_close(writer.get()), ARCHIVE_OK);
 }
 
-SnapshotTest::SnapshotTest() {
+SnapshotFixture::SnapshotFixture() {
   options.storageDirectory = scratch.path() / "state";
   options.paths.proc = scratch.path() / "proc";
   options.paths.alsa = scratch.path() / "asound";
@@ -84,7 +84,7 @@ SnapshotTest::SnapshotTest() {
   fs::create_directories(options.paths.proc);
 }
 
-std::future<Dictionary> SnapshotTest::request(const std::string& process) {
+std::future<Dictionary> SnapshotFixture::request(const std::string& process) {
   const auto reporter = service->createReporter();
   const Dictionary signature = reporter->makeSignature("Acoustat", "haptics", "Session_Generic",
                                                        "Joulebook", process, std::nullopt);
@@ -95,7 +95,7 @@ std::future<Dictionary> SnapshotTest::request(const std::string& process) {
   return promise->get_future();
 }
 
-Dictionary SnapshotTest::responseOf(std::future<Dictionary> response) {
+Dictionary SnapshotFixture::responseOf(std::future<Dictionary> response) {
   if (response.wait_for(kPatience) != std::future_status::ready) {
     ADD_FAILURE() << "no response came in time";
     return {};
@@ -103,12 +103,12 @@ Dictionary SnapshotTest::responseOf(std::future<Dictionary> response) {
   return response.get();
 }
 
-std::string SnapshotTest::textOf(const Dictionary& response, const char* key) {
+std::string SnapshotFixture::textOf(const Dictionary& response, const char* key) {
   const Value* value = response.find(key);
   return value == nullptr ? std::string() : std::string(value->string());
 }
 
-std::vector<std::string> SnapshotTest::names() const {
+std::vector<std::string> SnapshotFixture::names() const {
   std::vector<std::string> names;
   std::error_code ignored;
   for (const auto& entry : fs::directory_iterator(directory(), ignored)) {

@@ -18,7 +18,7 @@
 namespace halvox::platform::linux_ {
 
 // A fixture with a service whose root, in a scratch directory, does not exist yet.
-class FilesTest : public testing::Test {
+class FilesFixture : public testing::Test {
  protected:
   // Commits the file and returns the code of its error, or 0.
   static std::int64_t codeOf(JsonArrayFile& file) {
