@@ -1,0 +1,107 @@
+#include "platform/linux/LinuxAdapters.h"
+
+#include <filesystem>
+#include <utility>
+#include <variant>
+
+#include "platform/linux/configuration/ConfigurationEnvironment.h"
+#include "platform/linux/drivers/ConfiguredSources.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+ConnectionOptions connectionOptions(const Configuration& configuration) {
+  ConnectionOptions options;
+  options.socket = configuration.listener.socket;
+  options.socketAccess = {configuration.listener.mode, configuration.listener.group};
+  options.makeSocketDirectory = configuration.listener.socket == defaultSocketPath();
+  options.bus = configuration.listener.bus;
+  options.starter = starterBus();
+  options.handshakeTimeout = configuration.listener.handshakeTimeout;
+  options.messageTimeout = configuration.listener.messageTimeout;
+  options.clientHistoryMegabytes = configuration.limits.clientHistoryMegabytes;
+  options.clientSessions = configuration.limits.clientSessions;
+  options.messageReporterIDs = configuration.limits.messageReporterIDs;
+  return options;
+}
+
+StoreOptions storeOptions(const Configuration& configuration) {
+  StoreOptions options;
+  options.directory = configuration.storage.directory;
+  options.retentionDays = configuration.storage.retentionDays;
+  options.maxMegabytes = configuration.storage.maxMegabytes;
+  options.wantedEvents = configuration.analytics.wanted;
+  return options;
+}
+
+SnapshotOptions snapshotOptions(const Configuration& configuration) {
+  SnapshotOptions options;
+  options.storageDirectory = configuration.storage.directory;
+  options.keep = configuration.keepSnapshots;
+  return options;
+}
+
+std::unique_ptr<KdebugService> makeKdebug(std::string& failure) {
+  const std::filesystem::path module = LttngKdebugService::modulePath();
+  if (module.empty()) {
+    failure = "not in this build";
+    return std::make_unique<NoKdebugService>();
+  }
+  auto loaded = LttngKdebugService::load(module);
+  if (auto* service = std::get_if<std::unique_ptr<KdebugService>>(&loaded)) {
+    return std::move(*service);
+  }
+  failure = std::get<std::string>(loaded);
+  return std::make_unique<NoKdebugService>();
+}
+
+}  // namespace
+
+LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()> onReportSignal)
+    : configuration(settings),
+      connections(
+          [this, &onReportSignal] {
+            ConnectionOptions options = connectionOptions(configuration);
+            options.beginBatch = [this] {
+              dispatch.holdPool();
+              dispatch.beginHelping();
+            };
+            options.endBatch = [this] { dispatch.endHelping(); };
+            // A client's answer should not wait until other threads are woken.
+            options.afterReplies = [this] { dispatch.wakePool(); };
+            options.onReportSignal = std::move(onReportSignal);
+            return options;
+          }(),
+          backpressure),
+      kdebug(makeKdebug(kdebugFailure)),
+      log(SpdlogLogService::onStandardError({configuration.logLevel, configuration.logMemoryLevel},
+                                            statistics)),
+      // Its last line tells why the process ended.
+      process([this] { log->stop(); }),
+      deviceProperties(configuration.device),
+      featureFlags(configuration.features),
+      store(storeOptions(configuration), {clock, statistics, backpressure}),
+      analytics(store, clock),
+      diagnosticReporters(snapshotOptions(configuration),
+                          {.statistics = statistics,
+                           .log = [this] { return log->keptLines(); },
+                           .recorder = &snapshotRecorder}),
+      files(configuration.storage.root, statistics),
+      preferenceReader(configuration.preferencesDirectory),
+      notify(configuration.notifyDirectory, preferenceReader, statistics),
+      preferences(preferenceReader, statistics),
+      ioReport(makeDriverSources(configuration.drivers), statistics),
+      resultsFiles(configuration.storage.root, statistics),
+      traces(makeTraceServices(configuration.storage.directory, statistics)),
+      dispatch(*log, statistics),
+      nats(configuration.link.backend == LinkBackend::kNats
+               ? makeNatsTlmReporting(configuration.link, {dispatch, statistics})
+               : nullptr) {}
+
+TLMReportingService& LinuxAdapters::realTimeLink() {
+  if (nats) return *nats;
+  if (configuration.link.backend == LinkBackend::kNone) return noLink;
+  return localLink;
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,87 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "platform/linux/SqliteSnapshotRecorder.h"
+#include "platform/linux/configuration/Configuration.h"
+#include "platform/linux/configuration/ConfiguredDevicePropertyService.h"
+#include "platform/linux/configuration/ConfiguredFeatureFlagService.h"
+#include "platform/linux/connection/LinuxConnectionService.h"
+#include "platform/linux/diagnostics/SnapshotDiagnosticReporterService.h"
+#include "platform/linux/dispatch/AsioDispatchService.h"
+#include "platform/linux/dispatch/Backpressure.h"
+#include "platform/linux/drivers/LinuxIOReportService.h"
+#include "platform/linux/files/RootedFileService.h"
+#include "platform/linux/kdebug/LttngKdebugService.h"
+#include "platform/linux/link/local/CallbackThread.h"
+#include "platform/linux/link/local/LocalTlmReportingService.h"
+#include "platform/linux/link/local/NoneTlmReportingService.h"
+#include "platform/linux/link/nats/NatsTlmReporting.h"
+#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/runtime/LibcClockService.h"
+#include "platform/linux/runtime/ProcfsProcessService.h"
+#include "platform/linux/settings/InotifyNotifyService.h"
+#include "platform/linux/settings/PreferenceReader.h"
+#include "platform/linux/settings/TomlPreferenceService.h"
+#include "platform/linux/store/SqliteAnalyticsService.h"
+#include "platform/linux/store/SqliteMetricService.h"
+#include "platform/linux/store/SqlitePowerLogService.h"
+#include "platform/linux/store/SqliteStore.h"
+#include "platform/linux/tracing/JsonResultsFileService.h"
+#include "platform/linux/tracing/PlistPropertyListService.h"
+#include "platform/linux/tracing/TraceServices.h"
+
+namespace halvox::platform::linux_ {
+
+// Every adapter of one process, in the order in which they need each other. Belongs to
+// LinuxPlatform, which opens and closes them. Its many includes are the reason for the header: only
+// the two sources that compose the service read it.
+struct LinuxAdapters {
+  // Starts the threads of the log and of the queues; nothing outside the process is touched yet.
+  // `onReportSignal` runs on the main thread for each SIGUSR1.
+  LinuxAdapters(const Configuration& settings, std::function<void()> onReportSignal);
+  LinuxAdapters(const LinuxAdapters&) = delete;
+  LinuxAdapters& operator=(const LinuxAdapters&) = delete;
+
+  // The adapter of the back-end that the configuration names.
+  [[nodiscard]] TLMReportingService& realTimeLink();
+
+  // The connections come before all that has threads, because they take the end signals from every
+  // thread that starts after them.
+  const Configuration configuration;
+  CounterStatisticsService statistics;
+  Backpressure backpressure;
+  LinuxConnectionService connections;
+  std::string kdebugFailure;
+  std::unique_ptr<KdebugService> kdebug;
+  std::unique_ptr<SpdlogLogService> log;
+  LibcClockService clock;
+  ProcfsProcessService process;
+  ConfiguredDevicePropertyService deviceProperties;
+  ConfiguredFeatureFlagService featureFlags;
+  SqliteStore store;
+  SqliteAnalyticsService analytics;
+  SqliteSnapshotRecorder snapshotRecorder{store};
+  SnapshotDiagnosticReporterService diagnosticReporters;
+  RootedFileService files;
+  SqliteMetricService metrics{store, clock};
+  PreferenceReader preferenceReader;
+  InotifyNotifyService notify;
+  SqlitePowerLogService powerLog{store, clock};
+  TomlPreferenceService preferences;
+  // Uses the queues, which come later; close() ends it while they are still there.
+  CallbackThread linkCallbacks{dispatch};
+  LocalTlmReportingService localLink{store, clock, linkCallbacks};
+  NoneTlmReportingService noLink{statistics, linkCallbacks};
+  LinuxIOReportService ioReport;
+  PlistPropertyListService propertyLists;
+  JsonResultsFileService resultsFiles;
+  const std::unique_ptr<TraceServices> traces;
+  AsioDispatchService dispatch;
+  const std::unique_ptr<NatsTlmReporting> nats;  // only when the link goes there
+};
+
+}  // namespace halvox::platform::linux_
