@@ -30,7 +30,7 @@ std::optional<Direction> streamDirection(std::string_view mediaClass);
 ReporterID reporterIDFor(std::uint32_t serverCookie, std::uint64_t serial);
 
 // Turns PipeWire's events into reporting sessions: each stream node has one while it exists. Does
-// not use PipeWire's library; PipeWireSource passes the events in their order. Ignores events about
+// not use PipeWire's library; StreamWatcher passes the events in their order. Ignores events about
 // unknown nodes and nodes that are not streams.
 // Belongs to the loop thread. Does not own the client, which must outlive it. The destructor ends
 // all sessions. Cannot fail: the client queues every operation.

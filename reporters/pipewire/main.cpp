@@ -13,8 +13,8 @@
 #include "platform/linux/configuration/Configuration.h"
 #include "reporters/pipewire/HalvoxReportingClient.h"
 #include "reporters/pipewire/MainLoop.h"
-#include "reporters/pipewire/PipeWireSource.h"
 #include "reporters/pipewire/StreamTracker.h"
+#include "reporters/pipewire/StreamWatcher.h"
 #include "reporters/pipewire/VerboseReportingClient.h"
 
 namespace {
@@ -91,7 +91,7 @@ void run(const Arguments& arguments) {
     wasLost = wasLost || !connected;
   });
   {
-    const PipeWireSource source(
+    const StreamWatcher watcher(
         loop.handle(), tracker,
         {.remote = arguments.remote, .log = logLine, .xruns = !arguments.noXruns});
     loop.run();

@@ -3,7 +3,7 @@
 #include "platform/linux/drivers/alsa/AlsaSource.h"
 #include "platform/linux/drivers/textfile/TextfileSource.h"
 #ifdef HALVOX_WITH_PIPEWIRE
-#include "platform/linux/drivers/pipewire/PipewireSource.h"
+#include "platform/linux/drivers/pipewire/PipeWireDriverSource.h"
 #endif
 
 namespace halvox::platform::linux_ {
@@ -13,7 +13,7 @@ std::vector<std::unique_ptr<DriverSource>> makeDriverSources(
   std::vector<std::unique_ptr<DriverSource>> sources;
   if (drivers.alsa) sources.push_back(std::make_unique<AlsaSource>(drivers.alsaRoot));
 #ifdef HALVOX_WITH_PIPEWIRE
-  if (drivers.pipewire) sources.push_back(std::make_unique<PipewireSource>());
+  if (drivers.pipewire) sources.push_back(std::make_unique<PipeWireDriverSource>());
 #endif
   sources.push_back(std::make_unique<TextfileSource>(drivers.textfiles));
   return sources;

@@ -4,7 +4,7 @@
 #include <span>
 
 #include "platform/linux/base/Utf8.h"
-#include "platform/linux/drivers/pipewire/PipewireChannel.h"
+#include "platform/linux/drivers/pipewire/NodeChannel.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -39,8 +39,8 @@ std::string readName(std::string_view name) {
 
 GraphStatistics::GraphStatistics()
     : connectionsChannels_{
-          makeChannel(describePipewireChannel(kSinkGroup, "pipewire", "connections")),
-          makeChannel(describePipewireChannel(kSourceGroup, "pipewire", "connections"))} {}
+          makeChannel(describeNodeChannel(kSinkGroup, "pipewire", "connections")),
+          makeChannel(describeNodeChannel(kSourceGroup, "pipewire", "connections"))} {}
 
 void GraphStatistics::serverLost(Time now) {
   for (auto& [id, node] : nodes_) keep(std::move(node), now);

@@ -4,7 +4,7 @@
 #include <span>
 #include <utility>
 
-#include "platform/linux/drivers/pipewire/PipewireChannel.h"
+#include "platform/linux/drivers/pipewire/NodeChannel.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -16,12 +16,12 @@ constexpr const char* kMicroseconds = "us";
 
 ChannelList::Channel makeSimple(const std::string& group, const std::string& driver,
                                 std::string name) {
-  return makeChannel(describePipewireChannel(group, driver, std::move(name)));
+  return makeChannel(describeNodeChannel(group, driver, std::move(name)));
 }
 
 ChannelList::Channel makeHistogram(const std::string& group, const std::string& driver,
                                    std::string name) {
-  ChannelDescription channel = describePipewireChannel(group, driver, std::move(name));
+  ChannelDescription channel = describeNodeChannel(group, driver, std::move(name));
   channel.format = IOReportFormat::kHistogram;
   channel.unitLabel = kMicroseconds;
   channel.buckets = DurationHistogram::bounds();
@@ -30,7 +30,7 @@ ChannelList::Channel makeHistogram(const std::string& group, const std::string& 
 
 ChannelList::Channel makeState(const std::string& group, const std::string& driver,
                                std::string name) {
-  ChannelDescription channel = describePipewireChannel(group, driver, std::move(name));
+  ChannelDescription channel = describeNodeChannel(group, driver, std::move(name));
   channel.format = IOReportFormat::kState;
   channel.unitLabel = kMicroseconds;
   channel.states = StateResidency::names();

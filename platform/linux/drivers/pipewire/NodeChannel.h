@@ -11,15 +11,15 @@ namespace halvox::platform::linux_ {
 // The groups under which sinks and sources are read, and the subgroup of both.
 inline constexpr const char* kSinkGroup = "Speaker";
 inline constexpr const char* kSourceGroup = "Rx";
-inline constexpr const char* kPipewireSubGroup = "PipeWire";
+inline constexpr const char* kPipeWireSubGroup = "PipeWire";
 
 // A counter of this source, to be made a channel of another format where that is meant.
-inline ChannelDescription describePipewireChannel(std::string group, std::string driver,
-                                                  std::string name) {
+inline ChannelDescription describeNodeChannel(std::string group, std::string driver,
+                                              std::string name) {
   ChannelDescription channel;
   channel.kind = IOReportKind::kCounter;
   channel.group = std::move(group);
-  channel.subGroup = kPipewireSubGroup;
+  channel.subGroup = kPipeWireSubGroup;
   channel.driverName = std::move(driver);
   channel.channelName = std::move(name);
   return channel;

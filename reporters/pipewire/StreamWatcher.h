@@ -19,7 +19,7 @@ namespace halvox::pipewire_reporter {
 // Without a server it tries to connect after 0.1 s, then after twice as long each time, up to 5 s.
 // Belongs to the loop thread. Does not own the loop and the tracker, which must outlive it. An
 // object that cannot be followed, for example for lack of permission, is logged and ignored.
-class PipeWireSource {
+class StreamWatcher {
  public:
   struct Options {
     std::string remote;  // the server's socket name; empty: PipeWire's default
@@ -32,10 +32,10 @@ class PipeWireSource {
 
   // Throws std::runtime_error when PipeWire's library cannot be set up. A missing server is not an
   // error.
-  PipeWireSource(pw_loop* loop, StreamTracker& tracker, Options options);
-  ~PipeWireSource();
-  PipeWireSource(const PipeWireSource&) = delete;
-  PipeWireSource& operator=(const PipeWireSource&) = delete;
+  StreamWatcher(pw_loop* loop, StreamTracker& tracker, Options options);
+  ~StreamWatcher();
+  StreamWatcher(const StreamWatcher&) = delete;
+  StreamWatcher& operator=(const StreamWatcher&) = delete;
 
  private:
   class Impl;

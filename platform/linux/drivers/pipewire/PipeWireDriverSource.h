@@ -19,16 +19,16 @@ namespace halvox::platform::linux_ {
 // as its socket appears while somebody does; the same when the server goes. Nothing wakes up in the
 // meantime. Until it is there, the only channels are "connections", which count how often it was
 // reached.
-class PipewireSource final : public DriverSource {
+class PipeWireDriverSource final : public DriverSource {
  public:
   struct Options {
     // How long open() waits for what the server has.
     std::chrono::milliseconds longestOpening{800};
   };
 
-  PipewireSource() : PipewireSource(Options()) {}
-  explicit PipewireSource(Options options);
-  ~PipewireSource() override;
+  PipeWireDriverSource() : PipeWireDriverSource(Options()) {}
+  explicit PipeWireDriverSource(Options options);
+  ~PipeWireDriverSource() override;
 
   [[nodiscard]] std::string_view name() const override { return "pipewire"; }
   void open() override;

@@ -17,13 +17,14 @@ namespace halvox::platform::linux_ {
 
 // Follows a PipeWire server and writes what it tells into the graph. All of it runs on the loop's
 // thread, except construction and destruction, while that thread does not run. Borrows loop and
-// graph. A server that goes or is not there is no error; it is waited for as PipewireSource says.
-class PipewireConnection {
+// graph. A server that goes or is not there is no error; it is waited for as PipeWireDriverSource
+// says.
+class GraphFollower {
  public:
-  PipewireConnection(pw_loop* loop, SharedGraph& graph);
-  ~PipewireConnection();
-  PipewireConnection(const PipewireConnection&) = delete;
-  PipewireConnection& operator=(const PipewireConnection&) = delete;
+  GraphFollower(pw_loop* loop, SharedGraph& graph);
+  ~GraphFollower();
+  GraphFollower(const GraphFollower&) = delete;
+  GraphFollower& operator=(const GraphFollower&) = delete;
 
   // False when the library cannot be used at all, which is logged.
   [[nodiscard]] bool isUsable() const { return context_ != nullptr; }

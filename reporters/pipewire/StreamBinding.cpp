@@ -1,4 +1,4 @@
-#include "reporters/pipewire/ObjectBinding.h"
+#include "reporters/pipewire/StreamBinding.h"
 
 #include <array>
 #include <utility>

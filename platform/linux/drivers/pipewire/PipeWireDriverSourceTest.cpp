@@ -1,4 +1,4 @@
-#include "platform/linux/drivers/pipewire/PipewireSource.h"
+#include "platform/linux/drivers/pipewire/PipeWireDriverSource.h"
 
 #include <algorithm>
 #include <filesystem>
@@ -73,12 +73,12 @@ Seen histogramOf(const std::shared_ptr<const Reading>& reading, std::string_view
 constexpr std::string_view kCycles = "demo-speakers/Speaker/PipeWire/cycles";
 
 // Without a server to ask.
-TEST(PipewireSourceAloneTest, OnlyTheConnectionsAreThereAndOpeningDoesNotWait) {
+TEST(PipeWireDriverSourceAloneTest, OnlyTheConnectionsAreThereAndOpeningDoesNotWait) {
   const FakePlatform platform;
   const ScratchDirectory directory;
   setenv("XDG_RUNTIME_DIR", directory.path().c_str(), 1);
   // Were it to wait, it would be for that long.
-  PipewireSource source({.longestOpening = 1h});
+  PipeWireDriverSource source({.longestOpening = 1h});
   const auto start = Clock::now();
 
   source.open();
@@ -90,11 +90,11 @@ TEST(PipewireSourceAloneTest, OnlyTheConnectionsAreThereAndOpeningDoesNotWait) {
   EXPECT_FALSE(source.isProfiling());
 }
 
-TEST(PipewireSourceAloneTest, AReadingMayOutliveTheSource) {
+TEST(PipeWireDriverSourceAloneTest, AReadingMayOutliveTheSource) {
   const FakePlatform platform;
   std::shared_ptr<const Reading> reading;
   {
-    PipewireSource source;
+    PipeWireDriverSource source;
     source.open();
     reading = source.read();
   }
@@ -102,7 +102,7 @@ TEST(PipewireSourceAloneTest, AReadingMayOutliveTheSource) {
   EXPECT_GE(reading->values.size(), 2U);
 }
 
-class PipewireSourceTest : public ::testing::Test {
+class PipeWireDriverSourceTest : public ::testing::Test {
  protected:
   void SetUp() override {
     if (const auto missing = PrivatePipeWire::missingTools(); !missing.empty()) {
@@ -110,7 +110,7 @@ class PipewireSourceTest : public ::testing::Test {
     }
     audio = std::make_unique<PrivatePipeWire>();
     ASSERT_TRUE(audio->isReady());
-    source = std::make_unique<PipewireSource>();
+    source = std::make_unique<PipeWireDriverSource>();
     source->open();
   }
   void TearDown() override { source.reset(); }
@@ -121,10 +121,10 @@ class PipewireSourceTest : public ::testing::Test {
 
   FakePlatform platform;
   std::unique_ptr<PrivatePipeWire> audio;
-  std::unique_ptr<PipewireSource> source;
+  std::unique_ptr<PipeWireDriverSource> source;
 };
 
-TEST_F(PipewireSourceTest, TheFirstReadingHasTheNodesAndTheirStates) {
+TEST_F(PipeWireDriverSourceTest, TheFirstReadingHasTheNodesAndTheirStates) {
   const auto reading = source->read();
 
   EXPECT_EQ(valueOf(reading, "pipewire/Speaker/PipeWire/connections"), 1);
@@ -135,7 +135,7 @@ TEST_F(PipewireSourceTest, TheFirstReadingHasTheNodesAndTheirStates) {
               ElementsAre(::testing::MatchesRegex(".*= (idle|suspended):0:[1-9][0-9]*")));
 }
 
-TEST_F(PipewireSourceTest, CyclesOfAPlaybackAreCountedWhileAReadingIsHeld) {
+TEST_F(PipeWireDriverSourceTest, CyclesOfAPlaybackAreCountedWhileAReadingIsHeld) {
   const auto first = source->read();
   ASSERT_TRUE(waitUntil([&] { return source->isProfiling(); }));
   ChildProcess player = play(2);
@@ -156,7 +156,7 @@ TEST_F(PipewireSourceTest, CyclesOfAPlaybackAreCountedWhileAReadingIsHeld) {
               ElementsAre(::testing::HasSubstr(" running:1:")));
 }
 
-TEST_F(PipewireSourceTest, TheProfilerIsBoundOnlyWhileReadingsAreHeld) {
+TEST_F(PipeWireDriverSourceTest, TheProfilerIsBoundOnlyWhileReadingsAreHeld) {
   EXPECT_FALSE(source->isProfiling());
   auto first = source->read();
   auto second = source->read();
@@ -171,7 +171,7 @@ TEST_F(PipewireSourceTest, TheProfilerIsBoundOnlyWhileReadingsAreHeld) {
   EXPECT_TRUE(waitUntil([&] { return !source->isProfiling(); }));
 }
 
-TEST_F(PipewireSourceTest, ASourceHasItsChannelsInItsGroupAndLosesThemWhenItGoes) {
+TEST_F(PipeWireDriverSourceTest, ASourceHasItsChannelsInItsGroupAndLosesThemWhenItGoes) {
   constexpr std::string_view kSource = "demo-microphone/Rx/PipeWire/cycles";
   ASSERT_EQ(valueOf(source->read(), kSource), -1);
 
@@ -186,12 +186,12 @@ TEST_F(PipewireSourceTest, ASourceHasItsChannelsInItsGroupAndLosesThemWhenItGoes
   EXPECT_TRUE(waitUntil([&] { return valueOf(source->read(), kSource) == -1; }));
 }
 
-TEST_F(PipewireSourceTest, AServerThatAppearsWhileAReadingIsHeldIsFound) {
+TEST_F(PipeWireDriverSourceTest, AServerThatAppearsWhileAReadingIsHeldIsFound) {
   constexpr std::string_view kConnections = "pipewire/Speaker/PipeWire/connections";
   const auto socket = audio->directory() / "run" / "pipewire-0";
   const auto elsewhere = audio->directory() / "socket";
   std::filesystem::rename(socket, elsewhere);
-  PipewireSource early;
+  PipeWireDriverSource early;
   early.open();
   const auto held = early.read();
   ASSERT_EQ(valueOf(held, kConnections), 0);
@@ -202,7 +202,7 @@ TEST_F(PipewireSourceTest, AServerThatAppearsWhileAReadingIsHeldIsFound) {
   EXPECT_TRUE(waitUntil([&] { return early.isProfiling(); }));
 }
 
-TEST_F(PipewireSourceTest, ARestartedServerIsFoundAgainAndItsNodesCountOn) {
+TEST_F(PipeWireDriverSourceTest, ARestartedServerIsFoundAgainAndItsNodesCountOn) {
   const auto held = source->read();
   {
     ChildProcess player = play(0.5);

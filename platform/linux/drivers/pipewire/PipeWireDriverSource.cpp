@@ -1,4 +1,4 @@
-#include "platform/linux/drivers/pipewire/PipewireSource.h"
+#include "platform/linux/drivers/pipewire/PipeWireDriverSource.h"
 
 #include <utility>
 
@@ -7,13 +7,13 @@
 #include "platform/linux/base/Mutex.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/ReadingMaker.h"
-#include "platform/linux/drivers/pipewire/PipewireConnection.h"
+#include "platform/linux/drivers/pipewire/GraphFollower.h"
 #include "platform/linux/drivers/pipewire/SharedGraph.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(driversCategory, "PipewireSource");
+constexpr UnitLog kLog(driversCategory, "PipeWireDriverSource");
 
 // Wakes the loop from any thread; does nothing once the loop is gone. Shared by the source and the
 // leases, which may outlive it.
@@ -50,7 +50,7 @@ class Lease {
 
 }  // namespace
 
-class PipewireSource::Impl {
+class PipeWireDriverSource::Impl {
  public:
   explicit Impl(Options options) : options_(options) { pw_init(nullptr, nullptr); }
   ~Impl() {
@@ -104,7 +104,7 @@ class PipewireSource::Impl {
     loop_ = pw_thread_loop_new("halvox-pipewire", nullptr);
     if (loop_ == nullptr) return false;
     pw_loop* const loop = pw_thread_loop_get_loop(loop_);
-    connection_ = std::make_unique<PipewireConnection>(loop, graph_);
+    connection_ = std::make_unique<GraphFollower>(loop, graph_);
     if (!connection_->isUsable()) return false;
     event_ = pw_loop_add_event(loop, &Impl::onRing, this);
     if (event_ == nullptr || pw_thread_loop_start(loop_) != 0) return false;
@@ -121,13 +121,14 @@ class PipewireSource::Impl {
   ReadingMaker maker_;  // of the thread of readings
   pw_thread_loop* loop_ = nullptr;
   spa_source* event_ = nullptr;
-  std::unique_ptr<PipewireConnection> connection_;
+  std::unique_ptr<GraphFollower> connection_;
 };
 
-PipewireSource::PipewireSource(Options options) : impl_(std::make_unique<Impl>(options)) {}
-PipewireSource::~PipewireSource() = default;
-void PipewireSource::open() { impl_->open(); }
-std::shared_ptr<const Reading> PipewireSource::read() { return impl_->read(); }
-bool PipewireSource::isProfiling() const { return impl_->isProfiling(); }
+PipeWireDriverSource::PipeWireDriverSource(Options options)
+    : impl_(std::make_unique<Impl>(options)) {}
+PipeWireDriverSource::~PipeWireDriverSource() = default;
+void PipeWireDriverSource::open() { impl_->open(); }
+std::shared_ptr<const Reading> PipeWireDriverSource::read() { return impl_->read(); }
+bool PipeWireDriverSource::isProfiling() const { return impl_->isProfiling(); }
 
 }  // namespace halvox::platform::linux_

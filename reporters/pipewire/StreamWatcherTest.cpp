@@ -1,4 +1,4 @@
-#include "reporters/pipewire/PipeWireSource.h"
+#include "reporters/pipewire/StreamWatcher.h"
 
 #include <chrono>
 #include <csignal>
@@ -19,7 +19,7 @@ using std::chrono::steady_clock;
 constexpr std::chrono::seconds kDeadline{30};
 
 // What the reporter sends for real streams of a private PipeWire.
-class PipeWireSourceTest : public testing::Test {
+class StreamWatcherTest : public testing::Test {
  protected:
   void SetUp() override {
     if (const auto missing = PrivatePipeWire::missingTools(); !missing.empty()) {
@@ -32,17 +32,17 @@ class PipeWireSourceTest : public testing::Test {
     follow({.remote = {}, .log = {}});
   }
   void TearDown() override {
-    source.reset();
+    watcher.reset();
     if (loop != nullptr) {
       pw_loop_leave(loop->handle());
     }
   }
 
-  // Makes a new source that logs to `log`.
-  void follow(PipeWireSource::Options options) {
+  // Makes a new watcher that logs to `log`.
+  void follow(StreamWatcher::Options options) {
     options.log = [this](std::string_view line) { log.emplace_back(line); };
-    source.reset();
-    source = std::make_unique<PipeWireSource>(loop->handle(), tracker, std::move(options));
+    watcher.reset();
+    watcher = std::make_unique<StreamWatcher>(loop->handle(), tracker, std::move(options));
   }
   void iterateFor(std::chrono::seconds time) const {
     const auto end = steady_clock::now() + time;
@@ -73,11 +73,11 @@ class PipeWireSourceTest : public testing::Test {
   std::unique_ptr<MainLoop> loop;
   RecordingReportingClient client;
   StreamTracker tracker{client};
-  std::unique_ptr<PipeWireSource> source;
+  std::unique_ptr<StreamWatcher> watcher;
   std::vector<std::string> log;
 };
 
-TEST_F(PipeWireSourceTest, ReportsPlaybackFromItsStartToItsEnd) {
+TEST_F(StreamWatcherTest, ReportsPlaybackFromItsStartToItsEnd) {
   ChildProcess player = play(0.5);
 
   ASSERT_TRUE(waitFor("destroy"));
@@ -97,7 +97,7 @@ TEST_F(PipeWireSourceTest, ReportsPlaybackFromItsStartToItsEnd) {
   EXPECT_EQ(client.last("volume").find(kVolumeProcessKey)->string(), "pw-cat");
 }
 
-TEST_F(PipeWireSourceTest, ReportsAVolumeThatIsChangedWhilePlaying) {
+TEST_F(StreamWatcherTest, ReportsAVolumeThatIsChangedWhilePlaying) {
   const ChildProcess player = play(20);
   ASSERT_TRUE(waitFor("volume"));
 
@@ -109,7 +109,7 @@ TEST_F(PipeWireSourceTest, ReportsAVolumeThatIsChangedWhilePlaying) {
   EXPECT_TRUE(client.last("volume").find(kPlayingKey)->toBool());
 }
 
-TEST_F(PipeWireSourceTest, ReportsCapture) {
+TEST_F(StreamWatcherTest, ReportsCapture) {
   const ChildProcess recorder(
       {"pw-record", "-P", "{ stream.capture.sink=true }", audio->directory() / "out.wav"});
 
@@ -119,7 +119,7 @@ TEST_F(PipeWireSourceTest, ReportsCapture) {
   EXPECT_TRUE(waitFor("record-start"));
 }
 
-TEST_F(PipeWireSourceTest, ReportsTheSerialOfTheStreamInItsIdentifier) {
+TEST_F(StreamWatcherTest, ReportsTheSerialOfTheStreamInItsIdentifier) {
   const ChildProcess player = play(20);
   ASSERT_TRUE(waitFor("configure"));
 
@@ -129,7 +129,7 @@ TEST_F(PipeWireSourceTest, ReportsTheSerialOfTheStreamInItsIdentifier) {
   EXPECT_EQ(static_cast<std::uint64_t>(client.calls().front().id) & 0xFFFFFFFFU, serial);
 }
 
-TEST_F(PipeWireSourceTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItReturns) {
+TEST_F(StreamWatcherTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItReturns) {
   {
     const ChildProcess player = play(20);
     ASSERT_TRUE(waitFor("playback-start"));
@@ -147,7 +147,7 @@ TEST_F(PipeWireSourceTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItRe
   EXPECT_TRUE(waitFor("playback-start", 2));
 }
 
-TEST_F(PipeWireSourceTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
+TEST_F(StreamWatcherTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
   // The sum of the losses in all reports so far, in seconds.
   const auto silence = [this] {
     double sum = 0;
@@ -183,7 +183,7 @@ TEST_F(PipeWireSourceTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
   EXPECT_LE(std::ranges::count(client.operations(), "playback-issue") - reportsBefore, 4);
 }
 
-TEST_F(PipeWireSourceTest, SleepsWhileThereIsNoStreamThoughThereIsAProfiler) {
+TEST_F(StreamWatcherTest, SleepsWhileThereIsNoStreamThoughThereIsAProfiler) {
   {
     const ChildProcess player = play(20);
     ASSERT_TRUE(waitFor("volume"));
@@ -196,7 +196,7 @@ TEST_F(PipeWireSourceTest, SleepsWhileThereIsNoStreamThoughThereIsAProfiler) {
   EXPECT_EQ(pw_loop_iterate(loop->handle(), kSeconds * 1000), 0);
 }
 
-TEST_F(PipeWireSourceTest, SleepsWhileNothingChangesWithoutXruns) {
+TEST_F(StreamWatcherTest, SleepsWhileNothingChangesWithoutXruns) {
   follow({.remote = {}, .log = {}, .xruns = false});
 
   const ChildProcess player = play(20);
@@ -211,8 +211,8 @@ TEST_F(PipeWireSourceTest, SleepsWhileNothingChangesWithoutXruns) {
   EXPECT_EQ(woken, 0);
 }
 
-TEST_F(PipeWireSourceTest, WaitsForAPipeWireThatIsNotThere) {
-  source.reset();
+TEST_F(StreamWatcherTest, WaitsForAPipeWireThatIsNotThere) {
+  watcher.reset();
   log.clear();
 
   follow({.remote = "nobody-home", .log = {}});

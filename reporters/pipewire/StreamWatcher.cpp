@@ -1,4 +1,4 @@
-#include "reporters/pipewire/PipeWireSource.h"
+#include "reporters/pipewire/StreamWatcher.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -16,8 +16,8 @@
 #include "platform/linux/pipewire/Handles.h"
 #include "platform/linux/pipewire/ObjectBinding.h"
 #include "platform/linux/pipewire/ProfileDecoder.h"
-#include "reporters/pipewire/ObjectBinding.h"
 #include "reporters/pipewire/ParamDecoder.h"
+#include "reporters/pipewire/StreamBinding.h"
 
 namespace halvox::pipewire_reporter {
 namespace {
@@ -64,7 +64,7 @@ Properties withClient(const Properties& stream, const Properties& client) {
 
 // The timer and all callbacks run on the loop thread. A callback may destroy bindings of other
 // objects, but not the one that called it: the library still uses that one.
-class PipeWireSource::Impl final : public StreamListener {
+class StreamWatcher::Impl final : public StreamListener {
  public:
   Impl(pw_loop* loop, StreamTracker& tracker, Options options)
       : loop_(loop), tracker_(tracker), options_(std::move(options)) {
@@ -135,7 +135,7 @@ class PipeWireSource::Impl final : public StreamListener {
   std::unique_ptr<ProfilerBinding> profiler_;
 };
 
-void PipeWireSource::Impl::connect() {
+void StreamWatcher::Impl::connect() {
   static const pw_core_events kCoreEvents = [] {
     pw_core_events events{};
     events.version = PW_VERSION_CORE_EVENTS;
@@ -165,7 +165,7 @@ void PipeWireSource::Impl::connect() {
   pw_registry_add_listener(registry_.get(), &registryHook_, &kRegistryEvents, this);
 }
 
-void PipeWireSource::Impl::disconnect() {
+void StreamWatcher::Impl::disconnect() {
   if (core_ == nullptr) {
     return;
   }
@@ -181,14 +181,14 @@ void PipeWireSource::Impl::disconnect() {
   tracker_.serverLost();
 }
 
-void PipeWireSource::Impl::retryAfter(milliseconds pause) {
+void StreamWatcher::Impl::retryAfter(milliseconds pause) {
   const auto seconds = std::chrono::floor<std::chrono::seconds>(pause);
   timespec value{.tv_sec = seconds.count(),
                  .tv_nsec = std::chrono::nanoseconds(pause - seconds).count()};
   pw_loop_update_timer(loop_, retry_, &value, nullptr, false);
 }
 
-void PipeWireSource::Impl::addNode(GlobalID id, const Properties& properties) {
+void StreamWatcher::Impl::addNode(GlobalID id, const Properties& properties) {
   if (!streamDirection(property(properties, PW_KEY_MEDIA_CLASS))) {
     tracker_.nodeAdded({.id = id,
                         .serial = idProperty(properties, kSerialProperty),
@@ -203,12 +203,12 @@ void PipeWireSource::Impl::addNode(GlobalID id, const Properties& properties) {
   updateProfiler();
 }
 
-void PipeWireSource::Impl::addLink(GlobalID id, const Properties& properties) {
+void StreamWatcher::Impl::addLink(GlobalID id, const Properties& properties) {
   tracker_.linkAdded(id, {.output = idProperty(properties, PW_KEY_LINK_OUTPUT_NODE),
                           .input = idProperty(properties, PW_KEY_LINK_INPUT_NODE)});
 }
 
-void PipeWireSource::Impl::removeGlobal(GlobalID id) {
+void StreamWatcher::Impl::removeGlobal(GlobalID id) {
   streams_.erase(id);
   clients_.erase(id);
   if (profilerID_ == id) {
@@ -221,7 +221,7 @@ void PipeWireSource::Impl::removeGlobal(GlobalID id) {
 
 // Follows the profiler only while there are streams: it wakes this process. Must not be called from
 // a callback of the profiler, whose binding it may destroy.
-void PipeWireSource::Impl::updateProfiler() {
+void StreamWatcher::Impl::updateProfiler() {
   if (!profilerID_.has_value() || streams_.empty()) {
     profiler_.reset();
   } else if (profiler_ == nullptr) {
@@ -230,13 +230,13 @@ void PipeWireSource::Impl::updateProfiler() {
   }
 }
 
-void PipeWireSource::Impl::onProfile(const spa_pod* profile) {
+void StreamWatcher::Impl::onProfile(const spa_pod* profile) {
   for (const ProfiledCycle& cycle : pipewire::decodeProfile(profile)) {
     tracker_.cycleEnded(cycle.time, cycle.length, cycle.late);
   }
 }
 
-void PipeWireSource::Impl::clientChanged(GlobalID id) {
+void StreamWatcher::Impl::clientChanged(GlobalID id) {
   for (const auto& [streamID, stream] : streams_) {
     if (stream.told && idProperty(stream.binding->properties(), kClientIDProperty) == id) {
       tracker_.streamPropertiesChanged(streamID, fullProperties(stream.binding->properties()));
@@ -244,12 +244,12 @@ void PipeWireSource::Impl::clientChanged(GlobalID id) {
   }
 }
 
-Properties PipeWireSource::Impl::fullProperties(const Properties& stream) const {
+Properties StreamWatcher::Impl::fullProperties(const Properties& stream) const {
   const auto client = clients_.find(idProperty(stream, kClientIDProperty));
   return client == clients_.end() ? stream : withClient(stream, client->second->properties());
 }
 
-void PipeWireSource::Impl::onStreamProperties(GlobalID id, const Properties& properties) {
+void StreamWatcher::Impl::onStreamProperties(GlobalID id, const Properties& properties) {
   const auto found = streams_.find(id);
   if (found == streams_.end()) {
     return;
@@ -268,11 +268,11 @@ void PipeWireSource::Impl::onStreamProperties(GlobalID id, const Properties& pro
                       .properties = all});
 }
 
-void PipeWireSource::Impl::onStreamState(GlobalID id, pw_node_state state) {
+void StreamWatcher::Impl::onStreamState(GlobalID id, pw_node_state state) {
   tracker_.streamRunningChanged(id, state == PW_NODE_STATE_RUNNING);
 }
 
-void PipeWireSource::Impl::onStreamParam(GlobalID id, std::uint32_t param, const spa_pod* value) {
+void StreamWatcher::Impl::onStreamParam(GlobalID id, std::uint32_t param, const spa_pod* value) {
   if (param == SPA_PARAM_Format) {
     if (const auto format = decodeFormat(value)) {
       tracker_.streamFormatChanged(id, *format);
@@ -282,13 +282,13 @@ void PipeWireSource::Impl::onStreamParam(GlobalID id, std::uint32_t param, const
   }
 }
 
-void PipeWireSource::Impl::onRetry(void* data, std::uint64_t /*expirations*/) {
+void StreamWatcher::Impl::onRetry(void* data, std::uint64_t /*expirations*/) {
   auto* self = static_cast<Impl*>(data);
   self->disconnect();
   self->connect();
 }
 
-void PipeWireSource::Impl::onCoreInfo(void* data, const pw_core_info* info) {
+void StreamWatcher::Impl::onCoreInfo(void* data, const pw_core_info* info) {
   auto* self = static_cast<Impl*>(data);
   if (!std::exchange(self->connected_, true)) {
     self->pause_ = kReconnectMin;
@@ -298,8 +298,8 @@ void PipeWireSource::Impl::onCoreInfo(void* data, const pw_core_info* info) {
   }
 }
 
-void PipeWireSource::Impl::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
-                                       const char* message) {
+void StreamWatcher::Impl::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
+                                      const char* message) {
   auto* self = static_cast<Impl*>(data);
   if (id != PW_ID_CORE || result != -EPIPE) {
     // ENOENT means that the object vanished before this process could bind it, which is normal.
@@ -314,9 +314,9 @@ void PipeWireSource::Impl::onCoreError(void* data, std::uint32_t id, int /*seque
   self->retryAfter(kReconnectSoon);
 }
 
-void PipeWireSource::Impl::onGlobal(void* data, std::uint32_t id, std::uint32_t /*permissions*/,
-                                    const char* type, std::uint32_t /*version*/,
-                                    const spa_dict* dict) {
+void StreamWatcher::Impl::onGlobal(void* data, std::uint32_t id, std::uint32_t /*permissions*/,
+                                   const char* type, std::uint32_t /*version*/,
+                                   const spa_dict* dict) {
   auto* self = static_cast<Impl*>(data);
   const std::string_view kind = type;
   if (kind == PW_TYPE_INTERFACE_Node) {
@@ -332,12 +332,12 @@ void PipeWireSource::Impl::onGlobal(void* data, std::uint32_t id, std::uint32_t 
   }
 }
 
-void PipeWireSource::Impl::onGlobalRemove(void* data, std::uint32_t id) {
+void StreamWatcher::Impl::onGlobalRemove(void* data, std::uint32_t id) {
   static_cast<Impl*>(data)->removeGlobal(id);
 }
 
-PipeWireSource::PipeWireSource(pw_loop* loop, StreamTracker& tracker, Options options)
+StreamWatcher::StreamWatcher(pw_loop* loop, StreamTracker& tracker, Options options)
     : impl_(std::make_unique<Impl>(loop, tracker, std::move(options))) {}
-PipeWireSource::~PipeWireSource() = default;
+StreamWatcher::~StreamWatcher() = default;
 
 }  // namespace halvox::pipewire_reporter

@@ -1,4 +1,4 @@
-#include "platform/linux/drivers/pipewire/PipewireConnection.h"
+#include "platform/linux/drivers/pipewire/GraphFollower.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -17,7 +17,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(driversCategory, "PipewireConnection");
+constexpr UnitLog kLog(driversCategory, "GraphFollower");
 
 // The first answer tells that all objects were announced, the second that all told their state.
 constexpr int kRoundTrips = 2;
@@ -70,9 +70,9 @@ pipewire::UniqueContext makeContext(pw_loop* loop) {
 }  // namespace
 
 // A sink or a source: tells its states.
-class PipewireConnection::Node {
+class GraphFollower::Node {
  public:
-  Node(PipewireConnection& connection, GlobalID id)
+  Node(GraphFollower& connection, GlobalID id)
       : graph_(connection.graph_),
         id_(id),
         binding_(connection.registry_.get(), id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE) {
@@ -94,36 +94,36 @@ class PipewireConnection::Node {
   pipewire::ObjectBinding binding_;
 };
 
-PipewireConnection::PipewireConnection(pw_loop* loop, SharedGraph& graph)
+GraphFollower::GraphFollower(pw_loop* loop, SharedGraph& graph)
     : loop_(loop),
       graph_(graph),
-      timer_(pw_loop_add_timer(loop, &PipewireConnection::onTimer, this)),
+      timer_(pw_loop_add_timer(loop, &GraphFollower::onTimer, this)),
       watch_(loop, [this] { serverAppeared(); }) {
   if (timer_ != nullptr) context_ = makeContext(loop);
   if (context_ == nullptr) kLog.error("cannot set up PipeWire's library: ", messageOf(errno));
 }
 
-PipewireConnection::~PipewireConnection() {
+GraphFollower::~GraphFollower() {
   disconnect();
   if (timer_ != nullptr) pw_loop_destroy_source(loop_, timer_);
 }
 
-void PipewireConnection::update() {
+void GraphFollower::update() {
   attempts_ = std::max(attempts_, 1);
   proceed();
 }
 
-void PipewireConnection::serverAppeared() {
+void GraphFollower::serverAppeared() {
   attempts_ = kAttempts;
   proceed();
 }
 
-bool PipewireConnection::isLeased() {
+bool GraphFollower::isLeased() {
   const MutexLock lock(graph_.mutex);
   return !graph_.lease.expired();
 }
 
-void PipewireConnection::proceed() {
+void GraphFollower::proceed() {
   proceedAfter(std::nullopt);
   const bool isWanted = isLeased();
   if (std::exchange(isLost_, false)) {
@@ -139,7 +139,7 @@ void PipewireConnection::proceed() {
   updateProfiler(isWanted);
 }
 
-void PipewireConnection::lookForServer() {
+void GraphFollower::lookForServer() {
   // First, so that none appears unseen after the attempt.
   watch_.begin();
   if (attempts_ == 0) return;
@@ -148,7 +148,7 @@ void PipewireConnection::lookForServer() {
   if (core_ == nullptr && attempts_ > 0) proceedAfter(kPauseBetweenAttempts);
 }
 
-void PipewireConnection::connect() {
+void GraphFollower::connect() {
   isTried_ = true;
   core_.reset(pw_context_connect(
       context_.get(), pw_properties_new(PW_KEY_APP_NAME, "halvox-reportingd", nullptr), 0));
@@ -162,19 +162,19 @@ void PipewireConnection::connect() {
   settle();
 }
 
-void PipewireConnection::listen() {
+void GraphFollower::listen() {
   static const pw_core_events kCoreEvents = [] {
     pw_core_events events{};
     events.version = PW_VERSION_CORE_EVENTS;
-    events.info = &PipewireConnection::onCoreInfo;
-    events.done = &PipewireConnection::onCoreDone;
-    events.error = &PipewireConnection::onCoreError;
+    events.info = &GraphFollower::onCoreInfo;
+    events.done = &GraphFollower::onCoreDone;
+    events.error = &GraphFollower::onCoreError;
     return events;
   }();
   static const pw_registry_events kRegistryEvents = {
       .version = PW_VERSION_REGISTRY_EVENTS,
-      .global = &PipewireConnection::onGlobal,
-      .global_remove = &PipewireConnection::onGlobalRemove};
+      .global = &GraphFollower::onGlobal,
+      .global_remove = &GraphFollower::onGlobalRemove};
   pw_core_add_listener(core_.get(), &coreHook_, &kCoreEvents, this);
   registry_.reset(pw_core_get_registry(core_.get(), PW_VERSION_REGISTRY, 0));
   pw_registry_add_listener(registry_.get(), &registryHook_, &kRegistryEvents, this);
@@ -183,7 +183,7 @@ void PipewireConnection::listen() {
   sync_ = pw_core_sync(core_.get(), PW_ID_CORE, 0);
 }
 
-void PipewireConnection::disconnect() {
+void GraphFollower::disconnect() {
   if (core_ == nullptr) return;
   updateProfiler(false);
   profilerID_.reset();
@@ -197,7 +197,7 @@ void PipewireConnection::disconnect() {
   graph_.statistics.serverLost(Clock::now());
 }
 
-void PipewireConnection::settle() {
+void GraphFollower::settle() {
   {
     const MutexLock lock(graph_.mutex);
     graph_.isSettled = true;
@@ -205,7 +205,7 @@ void PipewireConnection::settle() {
   graph_.settled.notifyAll();
 }
 
-void PipewireConnection::proceedAfter(std::optional<Clock::duration> pause) {
+void GraphFollower::proceedAfter(std::optional<Clock::duration> pause) {
   timespec value{};
   if (pause.has_value()) {
     // Nothing would stop the timer.
@@ -217,7 +217,7 @@ void PipewireConnection::proceedAfter(std::optional<Clock::duration> pause) {
   pw_loop_update_timer(loop_, timer_, &value, nullptr, false);
 }
 
-void PipewireConnection::updateProfiler(bool isWanted) {
+void GraphFollower::updateProfiler(bool isWanted) {
   const bool isPossible = core_ != nullptr && profilerID_.has_value();
   if (isWanted && isPossible && profiler_ == nullptr) {
     {
@@ -233,18 +233,18 @@ void PipewireConnection::updateProfiler(bool isWanted) {
   graph_.isProfiling = profiler_ != nullptr;
 }
 
-void PipewireConnection::onProfile(const spa_pod* profile) {
+void GraphFollower::onProfile(const spa_pod* profile) {
   const auto cycles = pipewire::decodeProfile(profile);
   const MutexLock lock(graph_.mutex);
   for (const pipewire::ProfiledCycle& cycle : cycles) graph_.statistics.cycleEnded(cycle);
 }
 
-void PipewireConnection::onTimer(void* data, std::uint64_t /*expirations*/) {
-  static_cast<PipewireConnection*>(data)->proceed();
+void GraphFollower::onTimer(void* data, std::uint64_t /*expirations*/) {
+  static_cast<GraphFollower*>(data)->proceed();
 }
 
-void PipewireConnection::onCoreInfo(void* data, const pw_core_info* info) {
-  auto* self = static_cast<PipewireConnection*>(data);
+void GraphFollower::onCoreInfo(void* data, const pw_core_info* info) {
+  auto* self = static_cast<GraphFollower*>(data);
   // It is told again when the server's properties change.
   if (std::exchange(self->isReached_, true)) return;
   self->isMissingTold_ = false;
@@ -254,8 +254,8 @@ void PipewireConnection::onCoreInfo(void* data, const pw_core_info* info) {
   self->graph_.statistics.serverReached();
 }
 
-void PipewireConnection::onCoreDone(void* data, std::uint32_t id, int sequence) {
-  auto* self = static_cast<PipewireConnection*>(data);
+void GraphFollower::onCoreDone(void* data, std::uint32_t id, int sequence) {
+  auto* self = static_cast<GraphFollower*>(data);
   if (id != PW_ID_CORE || sequence != self->sync_) return;
   if (++self->roundTrips_ < kRoundTrips) {
     self->sync_ = pw_core_sync(self->core_.get(), PW_ID_CORE, 0);
@@ -264,9 +264,9 @@ void PipewireConnection::onCoreDone(void* data, std::uint32_t id, int sequence) 
   }
 }
 
-void PipewireConnection::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
-                                     const char* message) {
-  auto* self = static_cast<PipewireConnection*>(data);
+void GraphFollower::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
+                                const char* message) {
+  auto* self = static_cast<GraphFollower*>(data);
   if (id != PW_ID_CORE || result != -EPIPE) {
     // An object that went before it could be asked is no news.
     if (result != -ENOENT) kLog.info("PipeWire refused: ", message, " (object ", id, ")");
@@ -278,10 +278,10 @@ void PipewireConnection::onCoreError(void* data, std::uint32_t id, int /*sequenc
   self->proceedAfter(Clock::duration::zero());
 }
 
-void PipewireConnection::onGlobal(void* data, std::uint32_t id, std::uint32_t /*permissions*/,
-                                  const char* type, std::uint32_t /*version*/,
-                                  const spa_dict* properties) {
-  auto* self = static_cast<PipewireConnection*>(data);
+void GraphFollower::onGlobal(void* data, std::uint32_t id, std::uint32_t /*permissions*/,
+                             const char* type, std::uint32_t /*version*/,
+                             const spa_dict* properties) {
+  auto* self = static_cast<GraphFollower*>(data);
   const std::string_view kind = type;
   if (kind == PW_TYPE_INTERFACE_Node) {
     bool isWanted = false;
@@ -297,8 +297,8 @@ void PipewireConnection::onGlobal(void* data, std::uint32_t id, std::uint32_t /*
   }
 }
 
-void PipewireConnection::onGlobalRemove(void* data, std::uint32_t id) {
-  auto* self = static_cast<PipewireConnection*>(data);
+void GraphFollower::onGlobalRemove(void* data, std::uint32_t id) {
+  auto* self = static_cast<GraphFollower*>(data);
   if (self->profilerID_ == id) {
     self->profilerID_.reset();
     self->updateProfiler(false);
