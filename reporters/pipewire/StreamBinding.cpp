@@ -1,41 +1,10 @@
 #include "reporters/pipewire/StreamBinding.h"
 
 #include <array>
-#include <utility>
+
+#include "reporters/pipewire/DictDecoder.h"
 
 namespace halvox::pipewire_reporter {
-
-Properties makeProperties(const spa_dict* dict) {
-  Properties properties;
-  if (dict == nullptr) {
-    return properties;
-  }
-  const spa_dict_item* item = nullptr;
-  spa_dict_for_each(item, dict) {
-    if (item->key != nullptr && item->value != nullptr) {
-      properties.insert_or_assign(item->key, item->value);
-    }
-  }
-  return properties;
-}
-
-ClientBinding::ClientBinding(pw_registry* registry, std::uint32_t id, std::function<void()> changed)
-    : changed_(std::move(changed)),
-      binding_(registry, id, PW_TYPE_INTERFACE_Client, PW_VERSION_CLIENT) {
-  static const pw_client_events kEvents = {
-      .version = PW_VERSION_CLIENT_EVENTS, .info = &ClientBinding::onInfo, .permissions = nullptr};
-  if (binding_.isBound()) {
-    binding_.listen(&kEvents, this);
-  }
-}
-
-void ClientBinding::onInfo(void* data, const pw_client_info* info) {
-  auto* self = static_cast<ClientBinding*>(data);
-  if ((info->change_mask & PW_CLIENT_CHANGE_MASK_PROPS) != 0) {
-    self->properties_ = makeProperties(info->props);
-    self->changed_();
-  }
-}
 
 StreamBinding::StreamBinding(pw_registry* registry, std::uint32_t id, StreamListener& listener)
     : id_(id),

@@ -1,8 +1,6 @@
 #pragma once
 
 #include <cstdint>
-#include <functional>
-#include <string>
 
 #include <pipewire/pipewire.h>
 
@@ -10,26 +8,6 @@
 #include "reporters/pipewire/StreamProperties.h"
 
 namespace halvox::pipewire_reporter {
-
-using pipewire::ObjectBinding;
-
-Properties makeProperties(const spa_dict* dict);
-
-// Follows the properties of one client of the server, and calls `changed` when they change. Belongs
-// to the loop thread. If the server refuses the binding, `changed` is never called.
-class ClientBinding {
- public:
-  ClientBinding(pw_registry* registry, std::uint32_t id, std::function<void()> changed);
-
-  [[nodiscard]] const Properties& properties() const { return properties_; }
-
- private:
-  static void onInfo(void* data, const pw_client_info* info);
-
-  std::function<void()> changed_;
-  Properties properties_;
-  ObjectBinding binding_;
-};
 
 // Receives the events of a StreamBinding on the loop thread.
 class StreamListener {
@@ -62,7 +40,7 @@ class StreamBinding {
   std::uint32_t id_;
   StreamListener& listener_;
   Properties properties_;
-  ObjectBinding binding_;
+  pipewire::ObjectBinding binding_;
 };
 
 }  // namespace halvox::pipewire_reporter

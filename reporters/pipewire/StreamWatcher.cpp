@@ -10,12 +10,14 @@
 
 #include <fmt/format.h>
 #include <pipewire/extensions/profiler.h>
-#include <pipewire/impl-module.h>
 #include <pipewire/pipewire.h>
 
 #include "platform/linux/pipewire/Handles.h"
-#include "platform/linux/pipewire/ObjectBinding.h"
 #include "platform/linux/pipewire/ProfileDecoder.h"
+#include "platform/linux/pipewire/ProfilerBinding.h"
+#include "platform/linux/pipewire/ServerConnection.h"
+#include "reporters/pipewire/ClientBinding.h"
+#include "reporters/pipewire/DictDecoder.h"
 #include "reporters/pipewire/ParamDecoder.h"
 #include "reporters/pipewire/StreamBinding.h"
 
@@ -64,19 +66,20 @@ Properties withClient(const Properties& stream, const Properties& client) {
 
 // The timer and all callbacks run on the loop thread. A callback may destroy bindings of other
 // objects, but not the one that called it: the library still uses that one.
-class StreamWatcher::Impl final : public StreamListener {
+class StreamWatcher::Impl final : public StreamListener, private pipewire::ServerListener {
  public:
   Impl(pw_loop* loop, StreamTracker& tracker, Options options)
-      : loop_(loop), tracker_(tracker), options_(std::move(options)) {
-    context_.reset(pw_context_new(loop, nullptr, 0));
-    retry_ = pw_loop_add_timer(loop, &Impl::onRetry, this);
+      : loop_(loop),
+        tracker_(tracker),
+        options_(std::move(options)),
+        retry_(pw_loop_add_timer(loop, &Impl::onRetry, this)),
+        context_(pw_context_new(loop, nullptr, 0)),
+        server_(context_.get(), *this) {
     if (context_ == nullptr || retry_ == nullptr) {
       throw std::runtime_error(fmt::format("cannot set up PipeWire's library: {}",
                                            std::generic_category().message(errno)));
     }
-    // Without this module the library cannot decode the profiler's messages.
-    if (options_.xruns && pw_context_load_module(context_.get(), PW_EXTENSION_MODULE_PROFILER,
-                                                 nullptr, nullptr) == nullptr) {
+    if (options_.xruns && !pipewire::loadProfilerModule(context_.get())) {
       options_.xruns = false;
       options_.log("xruns are not reported: PipeWire's profiler module is not installed");
     }
@@ -93,7 +96,6 @@ class StreamWatcher::Impl final : public StreamListener {
   void retryAfter(milliseconds pause);
   void addNode(GlobalID id, const Properties& properties);
   void addLink(GlobalID id, const Properties& properties);
-  void removeGlobal(GlobalID id);
   void clientChanged(GlobalID id);
   void updateProfiler();
   void onProfile(const spa_pod* profile);
@@ -103,13 +105,13 @@ class StreamWatcher::Impl final : public StreamListener {
   void onStreamState(GlobalID id, pw_node_state state) override;
   void onStreamParam(GlobalID id, std::uint32_t param, const spa_pod* value) override;
 
+  void onServerReached(const pw_core_info& server) override;
+  void onServerLost() override;
+  void onGlobal(const pipewire::Global& global) override;
+  void onGlobalRemoved(GlobalID id) override;
+  void onRefused(GlobalID id, const char* message) override;
+
   static void onRetry(void* data, std::uint64_t expirations);
-  static void onCoreInfo(void* data, const pw_core_info* info);
-  static void onCoreError(void* data, std::uint32_t id, int sequence, int result,
-                          const char* message);
-  static void onGlobal(void* data, std::uint32_t id, std::uint32_t permissions, const char* type,
-                       std::uint32_t version, const spa_dict* dict);
-  static void onGlobalRemove(void* data, std::uint32_t id);
 
   struct Stream {
     Properties announced;  // from the registry; the stream's client cannot change these
@@ -120,15 +122,11 @@ class StreamWatcher::Impl final : public StreamListener {
   pw_loop* loop_;
   StreamTracker& tracker_;
   Options options_;
-  spa_source* retry_ = nullptr;
+  spa_source* const retry_;
   milliseconds pause_ = kReconnectMin;
-  bool connected_ = false;
   bool waitingTold_ = false;
   pipewire::UniqueContext context_;
-  pipewire::UniqueCore core_;
-  pipewire::UniqueRegistry registry_;
-  spa_hook coreHook_{};
-  spa_hook registryHook_{};
+  pipewire::ServerConnection server_;
   std::unordered_map<GlobalID, Stream> streams_;
   std::unordered_map<GlobalID, std::unique_ptr<ClientBinding>> clients_;
   std::optional<GlobalID> profilerID_;  // set while the server has a profiler
@@ -136,48 +134,30 @@ class StreamWatcher::Impl final : public StreamListener {
 };
 
 void StreamWatcher::Impl::connect() {
-  static const pw_core_events kCoreEvents = [] {
-    pw_core_events events{};
-    events.version = PW_VERSION_CORE_EVENTS;
-    events.info = &Impl::onCoreInfo;
-    events.error = &Impl::onCoreError;
-    return events;
-  }();
-  static const pw_registry_events kRegistryEvents = {.version = PW_VERSION_REGISTRY_EVENTS,
-                                                     .global = &Impl::onGlobal,
-                                                     .global_remove = &Impl::onGlobalRemove};
   pw_properties* properties =
       pw_properties_new(PW_KEY_APP_NAME, "halvox-pipewire-reporter", nullptr);
   if (!options_.remote.empty()) {
     pw_properties_set(properties, PW_KEY_REMOTE_NAME, options_.remote.c_str());
   }
-  core_.reset(pw_context_connect(context_.get(), properties, 0));
-  if (core_ == nullptr) {
-    if (!std::exchange(waitingTold_, true)) {
-      options_.log(fmt::format("waiting for PipeWire: {}", std::generic_category().message(errno)));
-    }
-    retryAfter(pause_);
-    pause_ = std::min(pause_ * 2, kReconnectMax);
+  if (server_.connect(properties)) {
     return;
   }
-  pw_core_add_listener(core_.get(), &coreHook_, &kCoreEvents, this);
-  registry_.reset(pw_core_get_registry(core_.get(), PW_VERSION_REGISTRY, 0));
-  pw_registry_add_listener(registry_.get(), &registryHook_, &kRegistryEvents, this);
+  if (!std::exchange(waitingTold_, true)) {
+    options_.log(fmt::format("waiting for PipeWire: {}", std::generic_category().message(errno)));
+  }
+  retryAfter(pause_);
+  pause_ = std::min(pause_ * 2, kReconnectMax);
 }
 
 void StreamWatcher::Impl::disconnect() {
-  if (core_ == nullptr) {
+  if (!server_.isConnected()) {
     return;
   }
   profiler_.reset();
   profilerID_.reset();
   streams_.clear();
   clients_.clear();
-  spa_hook_remove(&registryHook_);
-  registry_.reset();
-  spa_hook_remove(&coreHook_);
-  core_.reset();
-  connected_ = false;
+  server_.disconnect();
   tracker_.serverLost();
 }
 
@@ -199,24 +179,13 @@ void StreamWatcher::Impl::addNode(GlobalID id, const Properties& properties) {
   Stream& stream = streams_[id];
   stream.announced = properties;
   stream.told = false;
-  stream.binding = std::make_unique<StreamBinding>(registry_.get(), id, *this);
+  stream.binding = std::make_unique<StreamBinding>(server_.registry(), id, *this);
   updateProfiler();
 }
 
 void StreamWatcher::Impl::addLink(GlobalID id, const Properties& properties) {
   tracker_.linkAdded(id, {.output = idProperty(properties, PW_KEY_LINK_OUTPUT_NODE),
                           .input = idProperty(properties, PW_KEY_LINK_INPUT_NODE)});
-}
-
-void StreamWatcher::Impl::removeGlobal(GlobalID id) {
-  streams_.erase(id);
-  clients_.erase(id);
-  if (profilerID_ == id) {
-    profilerID_.reset();
-  }
-  updateProfiler();
-  tracker_.linkRemoved(id);
-  tracker_.nodeRemoved(id);
 }
 
 // Follows the profiler only while there are streams: it wakes this process. Must not be called from
@@ -226,7 +195,7 @@ void StreamWatcher::Impl::updateProfiler() {
     profiler_.reset();
   } else if (profiler_ == nullptr) {
     profiler_ = std::make_unique<ProfilerBinding>(
-        registry_.get(), *profilerID_, [this](const spa_pod* profile) { onProfile(profile); });
+        server_.registry(), *profilerID_, [this](const spa_pod* profile) { onProfile(profile); });
   }
 }
 
@@ -288,52 +257,47 @@ void StreamWatcher::Impl::onRetry(void* data, std::uint64_t /*expirations*/) {
   self->connect();
 }
 
-void StreamWatcher::Impl::onCoreInfo(void* data, const pw_core_info* info) {
-  auto* self = static_cast<Impl*>(data);
-  if (!std::exchange(self->connected_, true)) {
-    self->pause_ = kReconnectMin;
-    self->waitingTold_ = false;
-    self->options_.log(fmt::format("following PipeWire {} ({})", info->version, info->name));
-    self->tracker_.serverConnected(info->cookie);
+void StreamWatcher::Impl::onServerReached(const pw_core_info& server) {
+  pause_ = kReconnectMin;
+  waitingTold_ = false;
+  options_.log(fmt::format("following PipeWire {} ({})", server.version, server.name));
+  tracker_.serverConnected(server.cookie);
+}
+
+void StreamWatcher::Impl::onServerLost() {
+  options_.log("PipeWire has disconnected; ending its sessions and trying to reconnect");
+  // Let the timer disconnect: the library does not allow that within this call.
+  retryAfter(kReconnectSoon);
+}
+
+void StreamWatcher::Impl::onGlobal(const pipewire::Global& global) {
+  if (global.type == PW_TYPE_INTERFACE_Node) {
+    addNode(global.id, makeProperties(global.properties));
+  } else if (global.type == PW_TYPE_INTERFACE_Link) {
+    addLink(global.id, makeProperties(global.properties));
+  } else if (global.type == PW_TYPE_INTERFACE_Client) {
+    clients_[global.id] = std::make_unique<ClientBinding>(
+        server_.registry(), global.id, [this, id = global.id] { clientChanged(id); });
+  } else if (global.type == PW_TYPE_INTERFACE_Profiler && options_.xruns) {
+    profilerID_ = global.id;
+    updateProfiler();
   }
 }
 
-void StreamWatcher::Impl::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
-                                      const char* message) {
-  auto* self = static_cast<Impl*>(data);
-  if (id != PW_ID_CORE || result != -EPIPE) {
-    // ENOENT means that the object vanished before this process could bind it, which is normal.
-    if (result != -ENOENT) {
-      self->options_.log(
-          fmt::format("PipeWire refused a request: {} (object {}); it is ignored", message, id));
-    }
-    return;
+void StreamWatcher::Impl::onGlobalRemoved(GlobalID id) {
+  streams_.erase(id);
+  clients_.erase(id);
+  if (profilerID_ == id) {
+    profilerID_.reset();
   }
-  self->options_.log("PipeWire has disconnected; ending its sessions and trying to reconnect");
-  // Let the timer close the connection: the library does not allow that in its own callback.
-  self->retryAfter(kReconnectSoon);
+  updateProfiler();
+  tracker_.linkRemoved(id);
+  tracker_.nodeRemoved(id);
 }
 
-void StreamWatcher::Impl::onGlobal(void* data, std::uint32_t id, std::uint32_t /*permissions*/,
-                                   const char* type, std::uint32_t /*version*/,
-                                   const spa_dict* dict) {
-  auto* self = static_cast<Impl*>(data);
-  const std::string_view kind = type;
-  if (kind == PW_TYPE_INTERFACE_Node) {
-    self->addNode(id, makeProperties(dict));
-  } else if (kind == PW_TYPE_INTERFACE_Link) {
-    self->addLink(id, makeProperties(dict));
-  } else if (kind == PW_TYPE_INTERFACE_Client) {
-    self->clients_[id] = std::make_unique<ClientBinding>(self->registry_.get(), id,
-                                                         [self, id] { self->clientChanged(id); });
-  } else if (kind == PW_TYPE_INTERFACE_Profiler && self->options_.xruns) {
-    self->profilerID_ = id;
-    self->updateProfiler();
-  }
-}
-
-void StreamWatcher::Impl::onGlobalRemove(void* data, std::uint32_t id) {
-  static_cast<Impl*>(data)->removeGlobal(id);
+void StreamWatcher::Impl::onRefused(GlobalID id, const char* message) {
+  options_.log(
+      fmt::format("PipeWire refused a request: {} (object {}); it is ignored", message, id));
 }
 
 StreamWatcher::StreamWatcher(pw_loop* loop, StreamTracker& tracker, Options options)

@@ -1,15 +1,14 @@
 #pragma once
 
 #include <cstdint>
-#include <functional>
 
 #include <pipewire/pipewire.h>
 
 namespace halvox::pipewire {
 
-// Our end of one object of the server: owns the proxy and the hooks on it.
-// Belongs to the loop thread; it is destroyed when the object goes or the server does, never from
-// within a callback of its own.
+// Our end of one object of the server: owns the proxy and the hook on it. If the server refuses the
+// binding, no event comes. Belongs to the loop's thread. Destroy it when the object or the server
+// goes, but never within one of its own events: the library still uses it then.
 class ObjectBinding {
  public:
   ObjectBinding(pw_registry* registry, std::uint32_t id, const char* type, std::uint32_t version)
@@ -25,7 +24,7 @@ class ObjectBinding {
 
   [[nodiscard]] bool isBound() const { return proxy_ != nullptr; }
   [[nodiscard]] pw_proxy* proxy() const { return proxy_; }
-  // Once, and only when bound. `events` is static, `data` outlives this binding.
+  // Call it at most once, and only when bound. Both arguments must outlive the binding.
   void listen(const void* events, void* data) {
     pw_proxy_add_object_listener(proxy_, &hook_, events, data);
   }
@@ -33,21 +32,6 @@ class ObjectBinding {
  private:
   pw_proxy* proxy_;
   spa_hook hook_{};
-};
-
-// The profiler of the server: hands on each of its events, which come many times a second while
-// streams run. Lives only while they are wanted.
-class ProfilerBinding {
- public:
-  using ProfileHandler = std::function<void(const spa_pod* profile)>;
-
-  ProfilerBinding(pw_registry* registry, std::uint32_t id, ProfileHandler profiled);
-
- private:
-  static void onProfile(void* data, const spa_pod* profile);
-
-  ProfileHandler profiled_;
-  ObjectBinding binding_;
 };
 
 }  // namespace halvox::pipewire

@@ -12,6 +12,7 @@
 #include <pipewire/impl-module.h>
 
 #include "platform/linux/drivers/DriverSourceLog.h"
+#include "platform/linux/pipewire/ObjectBinding.h"
 #include "platform/linux/pipewire/ProfileDecoder.h"
 
 namespace halvox::platform::linux_ {
@@ -60,8 +61,7 @@ pipewire::UniqueContext makeContext(pw_loop* loop) {
                              nullptr) == nullptr) {
     return nullptr;
   }
-  if (pw_context_load_module(context.get(), PW_EXTENSION_MODULE_PROFILER, nullptr, nullptr) ==
-      nullptr) {
+  if (!pipewire::loadProfilerModule(context.get())) {
     kLog.error("PipeWire's profiler module is not installed: no cycles will be counted");
   }
   return context;
@@ -75,7 +75,7 @@ class GraphFollower::Node {
   Node(GraphFollower& connection, GlobalID id)
       : graph_(connection.graph_),
         id_(id),
-        binding_(connection.registry_.get(), id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE) {
+        binding_(connection.server_.registry(), id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE) {
     static const pw_node_events kEvents = {
         .version = PW_VERSION_NODE_EVENTS, .info = &Node::onInfo, .param = nullptr};
     if (binding_.isBound()) binding_.listen(&kEvents, this);
@@ -98,8 +98,9 @@ GraphFollower::GraphFollower(pw_loop* loop, SharedGraph& graph)
     : loop_(loop),
       graph_(graph),
       timer_(pw_loop_add_timer(loop, &GraphFollower::onTimer, this)),
-      watch_(loop, [this] { serverAppeared(); }) {
-  if (timer_ != nullptr) context_ = makeContext(loop);
+      watch_(loop, [this] { serverAppeared(); }),
+      context_(timer_ != nullptr ? makeContext(loop) : nullptr),
+      server_(context_.get(), *this) {
   if (context_ == nullptr) kLog.error("cannot set up PipeWire's library: ", messageOf(errno));
 }
 
@@ -134,8 +135,8 @@ void GraphFollower::proceed() {
     }
     return;
   }
-  if (core_ == nullptr && (isWanted || !isTried_)) lookForServer();
-  if (core_ != nullptr || !isWanted) watch_.end();
+  if (!server_.isConnected() && (isWanted || !isTried_)) lookForServer();
+  if (server_.isConnected() || !isWanted) watch_.end();
   updateProfiler(isWanted);
 }
 
@@ -145,15 +146,14 @@ void GraphFollower::lookForServer() {
   if (attempts_ == 0) return;
   --attempts_;
   connect();
-  if (core_ == nullptr && attempts_ > 0) proceedAfter(kPauseBetweenAttempts);
+  if (!server_.isConnected() && attempts_ > 0) proceedAfter(kPauseBetweenAttempts);
 }
 
 void GraphFollower::connect() {
   isTried_ = true;
-  core_.reset(pw_context_connect(
-      context_.get(), pw_properties_new(PW_KEY_APP_NAME, "halvox-reportingd", nullptr), 0));
-  if (core_ != nullptr) {
-    listen();
+  if (server_.connect(pw_properties_new(PW_KEY_APP_NAME, "halvox-reportingd", nullptr))) {
+    roundTrips_ = 0;
+    server_.requestAnswer();
     return;
   }
   if (!std::exchange(isMissingTold_, true)) {
@@ -162,36 +162,12 @@ void GraphFollower::connect() {
   settle();
 }
 
-void GraphFollower::listen() {
-  static const pw_core_events kCoreEvents = [] {
-    pw_core_events events{};
-    events.version = PW_VERSION_CORE_EVENTS;
-    events.info = &GraphFollower::onCoreInfo;
-    events.done = &GraphFollower::onCoreDone;
-    events.error = &GraphFollower::onCoreError;
-    return events;
-  }();
-  static const pw_registry_events kRegistryEvents = {
-      .version = PW_VERSION_REGISTRY_EVENTS,
-      .global = &GraphFollower::onGlobal,
-      .global_remove = &GraphFollower::onGlobalRemove};
-  pw_core_add_listener(core_.get(), &coreHook_, &kCoreEvents, this);
-  registry_.reset(pw_core_get_registry(core_.get(), PW_VERSION_REGISTRY, 0));
-  pw_registry_add_listener(registry_.get(), &registryHook_, &kRegistryEvents, this);
-  isReached_ = false;
-  roundTrips_ = 0;
-  sync_ = pw_core_sync(core_.get(), PW_ID_CORE, 0);
-}
-
 void GraphFollower::disconnect() {
-  if (core_ == nullptr) return;
+  if (!server_.isConnected()) return;
   updateProfiler(false);
   profilerID_.reset();
   nodes_.clear();
-  spa_hook_remove(&registryHook_);
-  registry_.reset();
-  spa_hook_remove(&coreHook_);
-  core_.reset();
+  server_.disconnect();
   settle();
   const MutexLock lock(graph_.mutex);
   graph_.statistics.serverLost(Clock::now());
@@ -218,14 +194,14 @@ void GraphFollower::proceedAfter(std::optional<Clock::duration> pause) {
 }
 
 void GraphFollower::updateProfiler(bool isWanted) {
-  const bool isPossible = core_ != nullptr && profilerID_.has_value();
+  const bool isPossible = server_.isConnected() && profilerID_.has_value();
   if (isWanted && isPossible && profiler_ == nullptr) {
     {
       const MutexLock lock(graph_.mutex);
       graph_.statistics.profilingBegan();
     }
     profiler_ = std::make_unique<pipewire::ProfilerBinding>(
-        registry_.get(), *profilerID_, [this](const spa_pod* profile) { onProfile(profile); });
+        server_.registry(), *profilerID_, [this](const spa_pod* profile) { onProfile(profile); });
   } else if (!isWanted || !isPossible) {
     profiler_.reset();
   }
@@ -243,69 +219,53 @@ void GraphFollower::onTimer(void* data, std::uint64_t /*expirations*/) {
   static_cast<GraphFollower*>(data)->proceed();
 }
 
-void GraphFollower::onCoreInfo(void* data, const pw_core_info* info) {
-  auto* self = static_cast<GraphFollower*>(data);
-  // It is told again when the server's properties change.
-  if (std::exchange(self->isReached_, true)) return;
-  self->isMissingTold_ = false;
-  self->attempts_ = kAttempts;
-  kLog.notice("following PipeWire ", info->version, " (", info->name, ")");
-  const MutexLock lock(self->graph_.mutex);
-  self->graph_.statistics.serverReached();
+void GraphFollower::onServerReached(const pw_core_info& server) {
+  isMissingTold_ = false;
+  attempts_ = kAttempts;
+  kLog.notice("following PipeWire ", server.version, " (", server.name, ")");
+  const MutexLock lock(graph_.mutex);
+  graph_.statistics.serverReached();
 }
 
-void GraphFollower::onCoreDone(void* data, std::uint32_t id, int sequence) {
-  auto* self = static_cast<GraphFollower*>(data);
-  if (id != PW_ID_CORE || sequence != self->sync_) return;
-  if (++self->roundTrips_ < kRoundTrips) {
-    self->sync_ = pw_core_sync(self->core_.get(), PW_ID_CORE, 0);
-  } else {
-    self->settle();
-  }
-}
-
-void GraphFollower::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
-                                const char* message) {
-  auto* self = static_cast<GraphFollower*>(data);
-  if (id != PW_ID_CORE || result != -EPIPE) {
-    // An object that went before it could be asked is no news.
-    if (result != -ENOENT) kLog.info("PipeWire refused: ", message, " (object ", id, ")");
-    return;
-  }
-  if (std::exchange(self->isLost_, true)) return;
+void GraphFollower::onServerLost() {
+  isLost_ = true;
   kLog.notice("PipeWire has gone");
-  // Later, because the connection cannot be closed from within its own callback.
-  self->proceedAfter(Clock::duration::zero());
+  // Let the timer disconnect: the library does not allow that within this call.
+  proceedAfter(Clock::duration::zero());
 }
 
-void GraphFollower::onGlobal(void* data, std::uint32_t id, std::uint32_t /*permissions*/,
-                             const char* type, std::uint32_t /*version*/,
-                             const spa_dict* properties) {
-  auto* self = static_cast<GraphFollower*>(data);
-  const std::string_view kind = type;
-  if (kind == PW_TYPE_INTERFACE_Node) {
+void GraphFollower::onGlobal(const pipewire::Global& global) {
+  if (global.type == PW_TYPE_INTERFACE_Node) {
     bool isWanted = false;
     {
-      const MutexLock lock(self->graph_.mutex);
-      isWanted = self->graph_.statistics.nodeAdded(id, lookUp(properties, PW_KEY_MEDIA_CLASS),
-                                                   lookUp(properties, PW_KEY_NODE_NAME));
+      const MutexLock lock(graph_.mutex);
+      isWanted =
+          graph_.statistics.nodeAdded(global.id, lookUp(global.properties, PW_KEY_MEDIA_CLASS),
+                                      lookUp(global.properties, PW_KEY_NODE_NAME));
     }
-    if (isWanted) self->nodes_[id] = std::make_unique<Node>(*self, id);
-  } else if (kind == PW_TYPE_INTERFACE_Profiler) {
-    self->profilerID_ = id;
-    self->updateProfiler(self->isLeased());
+    if (isWanted) nodes_[global.id] = std::make_unique<Node>(*this, global.id);
+  } else if (global.type == PW_TYPE_INTERFACE_Profiler) {
+    profilerID_ = global.id;
+    updateProfiler(isLeased());
   }
 }
 
-void GraphFollower::onGlobalRemove(void* data, std::uint32_t id) {
-  auto* self = static_cast<GraphFollower*>(data);
-  if (self->profilerID_ == id) {
-    self->profilerID_.reset();
-    self->updateProfiler(false);
+void GraphFollower::onGlobalRemoved(GlobalID id) {
+  if (profilerID_ == id) {
+    profilerID_.reset();
+    updateProfiler(false);
   }
-  self->nodes_.erase(id);
-  const MutexLock lock(self->graph_.mutex);
-  self->graph_.statistics.nodeRemoved(id, Clock::now());
+  nodes_.erase(id);
+  const MutexLock lock(graph_.mutex);
+  graph_.statistics.nodeRemoved(id, Clock::now());
+}
+
+void GraphFollower::onRefused(GlobalID id, const char* message) {
+  kLog.info("PipeWire refused: ", message, " (object ", id, ")");
+}
+
+void GraphFollower::onAnswered() {
+  ++roundTrips_ < kRoundTrips ? server_.requestAnswer() : settle();
 }
 
 }  // namespace halvox::platform::linux_

@@ -11,7 +11,8 @@
 #include "platform/linux/drivers/pipewire/ServerWatch.h"
 #include "platform/linux/drivers/pipewire/SharedGraph.h"
 #include "platform/linux/pipewire/Handles.h"
-#include "platform/linux/pipewire/ObjectBinding.h"
+#include "platform/linux/pipewire/ProfilerBinding.h"
+#include "platform/linux/pipewire/ServerConnection.h"
 
 namespace halvox::platform::linux_ {
 
@@ -19,12 +20,10 @@ namespace halvox::platform::linux_ {
 // thread, except construction and destruction, while that thread does not run. Borrows loop and
 // graph. A server that goes or is not there is no error; it is waited for as PipeWireDriverSource
 // says.
-class GraphFollower {
+class GraphFollower final : private pipewire::ServerListener {
  public:
   GraphFollower(pw_loop* loop, SharedGraph& graph);
-  ~GraphFollower();
-  GraphFollower(const GraphFollower&) = delete;
-  GraphFollower& operator=(const GraphFollower&) = delete;
+  ~GraphFollower() override;
 
   // False when the library cannot be used at all, which is logged.
   [[nodiscard]] bool isUsable() const { return context_ != nullptr; }
@@ -34,7 +33,7 @@ class GraphFollower {
 
  private:
   using Clock = std::chrono::steady_clock;
-  using GlobalID = std::uint32_t;
+  using GlobalID = pipewire::GlobalID;
   class Node;
 
   [[nodiscard]] bool isLeased();
@@ -42,7 +41,6 @@ class GraphFollower {
   void proceed();
   void lookForServer();
   void connect();
-  void listen();
   void disconnect();
   void settle();
   // Has proceed() run after that time, or not any more.
@@ -51,14 +49,13 @@ class GraphFollower {
   void updateProfiler(bool isWanted);
   void onProfile(const spa_pod* profile);
 
+  void onServerReached(const pw_core_info& server) override;
+  void onServerLost() override;
+  void onGlobal(const pipewire::Global& global) override;
+  void onGlobalRemoved(GlobalID id) override;
+  void onRefused(GlobalID id, const char* message) override;
+  void onAnswered() override;
   static void onTimer(void* data, std::uint64_t expirations);
-  static void onCoreInfo(void* data, const pw_core_info* info);
-  static void onCoreDone(void* data, std::uint32_t id, int sequence);
-  static void onCoreError(void* data, std::uint32_t id, int sequence, int result,
-                          const char* message);
-  static void onGlobal(void* data, std::uint32_t id, std::uint32_t permissions, const char* type,
-                       std::uint32_t version, const spa_dict* properties);
-  static void onGlobalRemove(void* data, std::uint32_t id);
 
   pw_loop* const loop_;
   SharedGraph& graph_;
@@ -67,15 +64,10 @@ class GraphFollower {
   int attempts_ = 0;  // to connect, that are left
   bool isTried_ = false;
   bool isLost_ = false;
-  bool isReached_ = false;
   bool isMissingTold_ = false;
-  int sync_ = 0;
   int roundTrips_ = 0;
   pipewire::UniqueContext context_;
-  pipewire::UniqueCore core_;
-  pipewire::UniqueRegistry registry_;
-  spa_hook coreHook_{};
-  spa_hook registryHook_{};
+  pipewire::ServerConnection server_;
   std::unordered_map<GlobalID, std::unique_ptr<Node>> nodes_;
   std::optional<GlobalID> profilerID_;
   std::unique_ptr<pipewire::ProfilerBinding> profiler_;

@@ -1,10 +1,15 @@
-#include "platform/linux/pipewire/ObjectBinding.h"
+#include "platform/linux/pipewire/ProfilerBinding.h"
 
 #include <utility>
 
 #include <pipewire/extensions/profiler.h>
+#include <pipewire/impl-module.h>
 
 namespace halvox::pipewire {
+
+bool loadProfilerModule(pw_context* context) {
+  return pw_context_load_module(context, PW_EXTENSION_MODULE_PROFILER, nullptr, nullptr) != nullptr;
+}
 
 ProfilerBinding::ProfilerBinding(pw_registry* registry, std::uint32_t id, ProfileHandler profiled)
     : profiled_(std::move(profiled)),
