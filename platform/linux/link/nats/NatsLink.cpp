@@ -13,24 +13,17 @@ namespace {
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 constexpr std::chrono::milliseconds kLibraryEndTime{2000};
 constexpr std::int64_t kDefaultSpin = -1;
-constexpr std::string_view kErrorDomain = "com.tarno.halvox.link";
-
-Error refuse(std::string description) {
-  return {.domain = std::string(kErrorDomain), .code = 1, .description = std::move(description)};
-}
-
 }  // namespace
 
 NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environment)
     : options_(std::move(options)),
       dispatch_(environment.dispatch),
-      statistics_(environment.statistics),
-      received_(statistics_.counter(kNatsPiece, "received")),
-      acknowledged_(statistics_.counter(kNatsPiece, "acknowledged")),
-      notAcknowledged_(statistics_.counter(kNatsPiece, "not acknowledged")),
-      publishedAgain_(statistics_.counter(kNatsPiece, "published again")) {
-  // Connecting would open the library, too, but the first message is made, and may be destroyed,
-  // before that.
+      publisher_(options_, environment.statistics, [this] {
+        const MutexLock lock(mutex_);
+        changed_.notifyAll();
+      }) {
+  // A connection would open the library, but messages are made, and may be destroyed, before the
+  // first connection.
   if (const natsStatus status = nats_Open(kDefaultSpin); status != NATS_OK) {
     kLog.error("the client library of the link does not start: ", natsStatus_GetText(status));
   }
@@ -47,14 +40,14 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
     if (!isRefused) failure = provideThread();
     if (!isRefused && failure.empty()) {
       wakeThread();
-      if (isConnected_) return answers_.push_back({std::move(found), servers_});
+      if (state_ == State::kConnected) return answers_.push_back({std::move(found), servers_});
       waiter = ++lastWaiter_;
       waiters_.push_back({waiter, std::exchange(found, nullptr)});
     }
   }
   if (!failure.empty()) kLog.error("no server of the link is looked for: ", failure);
   if (waiter == 0) {
-    // Without the thread that answers, the background queue does.
+    // No thread of ours to call back on.
     return dispatch_.asyncAfterOnBackgroundQueue(
         std::chrono::nanoseconds(0), [found = std::move(found)] { found(std::nullopt); });
   }
@@ -75,50 +68,45 @@ void NatsLink::expire(std::uint64_t waiter) {
   found(std::nullopt);
 }
 
-std::optional<Error> NatsLink::refusal(const OutgoingMessage& message) {
-  if (closeBy_) return refuse("the service is ending");
-  if (maxPayload_ > 0 && message.bytes > maxPayload_) {
-    return refuse("a message of " + std::to_string(message.bytes) + " bytes is more than the " +
-                  std::to_string(maxPayload_) + " that the server takes");
+std::optional<Error> NatsLink::refusal(std::size_t bytes) {
+  if (closeBy_) return refusedByLink("the service is ending");
+  if (maxPayload_ > 0 && bytes > maxPayload_) {
+    return refusedByLink("a message of " + std::to_string(bytes) + " bytes is more than the " +
+                         std::to_string(maxPayload_) + " that the server takes");
   }
-  if (queuedBytes_ + message.bytes > kQueueBytes) {
-    return refuse("no room: " + std::to_string(queue_.size()) + " messages wait for the server");
+  // The attempt that just failed answers for this message, too: the sender learns at once that
+  // messages are lost instead of after another time-out.
+  if (state_ == State::kIdle && !lastFailure_.empty() &&
+      std::chrono::steady_clock::now() < nextAttempt_) {
+    return refusedByLink("no server was reached: " + lastFailure_);
   }
-  // Where the last attempt failed a moment ago, the next message need not wait for another.
-  if (!connection_ && !lastFailure_.empty() && std::chrono::steady_clock::now() < nextAttempt_) {
-    return refuse("no server was reached: " + lastFailure_);
-  }
-  if (const std::string failure = provideThread(); !failure.empty()) return refuse(failure);
+  if (const std::string failure = provideThread(); !failure.empty()) return refusedByLink(failure);
   return std::nullopt;
 }
-
-void NatsLink::countRefused() { statistics_.counter(kNatsPiece, "failed: refused").add(); }
 
 std::optional<Error> NatsLink::refuseAtEnd() {
   {
     const MutexLock lock(mutex_);
     if (!closeBy_) return std::nullopt;
   }
-  received_.add();
-  countRefused();
-  return refuse("the service is ending");
+  publisher_.countReceived();
+  publisher_.refuse(OutgoingMessage());
+  return refusedByLink("the service is ending");
 }
 
 std::optional<Error> NatsLink::send(OutgoingMessage message) {
-  received_.add();
+  publisher_.countReceived();
   std::optional<Error> error;
   {
     const MutexLock lock(mutex_);
-    error = refusal(message);
+    error = refusal(message.bytes);
+    if (!error) error = publisher_.take(message);
     if (!error) {
-      queuedBytes_ += message.bytes;
-      queue_.push_back(std::move(message));
       wakeThread();
       return std::nullopt;
     }
   }
-  countRefused();
-  if (message.ledger) message.ledger->resolve(message.number, AckOutcome::kRefused);
+  publisher_.refuse(message);
   return error;
 }
 
@@ -128,7 +116,9 @@ bool NatsLink::close() {
     if (closeBy_) return !thread_.joinable();
     const Time now = std::chrono::steady_clock::now();
     closeBy_ = now + kCloseTime;
-    leaveBy_ = isConnecting_ ? now + kAttemptEndTime : *closeBy_ + kConnectionEndTime;
+    leaveBy_ =
+        state_ == State::kConnecting ? now + kAttemptEndTime : *closeBy_ + kConnectionEndTime;
+    publisher_.beginEnd();
     changed_.notifyAll();
   }
   if (!awaitThread()) {
@@ -137,14 +127,15 @@ bool NatsLink::close() {
     keepForEver();
     return false;
   }
-  // After this no callback of the library runs; if it does not end, they may still find this here.
+  // Once the library has ended, it calls no callback. Otherwise one may still run, and this object
+  // must stay.
   if (nats_CloseAndWait(kLibraryEndTime.count()) == NATS_OK) return true;
   kLog.error("the client library of the link did not end in time");
   keepForEver();
   return true;
 }
 
-// False when it is still busy when its time is over.
+// False if the thread still works at leaveBy_, which the thread itself may bring forward.
 bool NatsLink::awaitThread() {
   {
     const MutexLock lock(mutex_);
@@ -158,18 +149,13 @@ bool NatsLink::awaitThread() {
   return true;
 }
 
-// Does for the thread what it does at its end, but for the connection.
+// The part of end() that needs no connection, while the thread hangs in the library.
 void NatsLink::giveUpRest() {
-  std::vector<PendingAcks::Entry> lost;
-  std::deque<OutgoingMessage> unsent;
   {
     const MutexLock lock(mutex_);
-    isConnected_ = false;
-    lost = pending_.takeAll();
-    unsent.swap(queue_);
+    if (state_ == State::kConnected) state_ = State::kAway;
   }
-  abandon(lost, "the connection ended");
-  fail(unsent, "the service ended");
+  publisher_.abandonAll();
   answerWaiters();
 }
 
@@ -178,7 +164,7 @@ void NatsLink::keepForEver() {
   if (auto self = weak_from_this().lock()) kept->push_back(std::move(self));
 }
 
-// Why there is none; empty when there is one.
+// Starts the thread unless it runs. Returns why it cannot be started; empty on success.
 std::string NatsLink::provideThread() {
   if (thread_.joinable()) return {};
   try {
@@ -194,44 +180,41 @@ void NatsLink::wakeThread() {
   changed_.notifyAll();
 }
 
-// Whether there is nothing left to do after close(), or no time.
-bool NatsLink::isAtEnd(Time now) {
-  if (!closeBy_) return false;
-  const bool isAllDone = queue_.empty() && pending_.size() == 0;
-  return !connection_ || isLost_ || isAllDone || now >= *closeBy_;
+bool NatsLink::hasConnection() const {
+  return state_ != State::kIdle && state_ != State::kConnecting;
 }
 
-NatsLink::Step NatsLink::nextStepConnected(Time now) {
-  if (pending_.size() == 0) flow_ = Flow::kFlowing;
-  if (flow_ == Flow::kProbing) return Step::kWait;
-  if (flow_ == Flow::kHolding) return now >= probeAt_ ? Step::kProbe : Step::kWait;
-  if (pending_.needsAgain()) return pending_.hasAgain() ? Step::kSend : Step::kWait;
-  return !queue_.empty() && !isWindowFull_ ? Step::kSend : Step::kWait;
+// Whether somebody needs a connection.
+bool NatsLink::isNeeded() { return !waiters_.empty() || publisher_.hasQueued(); }
+
+// After close(): whether nothing is left to do, or no time to do it.
+bool NatsLink::isAtEnd(Time now) {
+  if (!closeBy_) return false;
+  return !hasConnection() || state_ == State::kLost || publisher_.isDone() || now >= *closeBy_;
 }
 
 NatsLink::Step NatsLink::nextStep(Time now) {
-  if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
   if (isAtEnd(now)) return Step::kEnd;
   if (!answers_.empty()) return Step::kTell;
-  if (isLost_) return Step::kDrop;
-  if (const auto deadline = pending_.firstDeadline(); deadline && now >= *deadline) {
-    return Step::kGiveUp;
+  if (state_ == State::kLost) return Step::kDrop;
+  if (const auto deadline = publisher_.firstDeadline(); deadline && now >= *deadline) {
+    return Step::kAbandon;
   }
-  if (isConnected_ && !waiters_.empty()) return Step::kAnswer;
-  if (!connection_) {
-    const bool isNeeded = !waiters_.empty() || !queue_.empty();
-    return isNeeded && now >= nextAttempt_ ? Step::kConnect : Step::kWait;
-  }
-  return isConnected_ ? nextStepConnected(now) : Step::kWait;
+  if (!hasConnection()) return now >= nextAttempt_ && isNeeded() ? Step::kConnect : Step::kWait;
+  if (state_ != State::kConnected) return Step::kWait;
+  if (!waiters_.empty()) return Step::kAnswer;
+  return publisher_.canPublish(now) ? Step::kPublish : Step::kWait;
 }
 
-// When there is something to do even if nothing changes.
+// When nextStep() can differ although nothing has changed.
 std::optional<NatsLink::Time> NatsLink::nextTime() {
   std::optional<Time> next = closeBy_;
-  const auto consider = [&next](Time time) { next = std::min(next.value_or(time), time); };
-  if (const auto deadline = pending_.firstDeadline()) consider(*deadline);
-  if (isConnected_ && flow_ == Flow::kHolding) consider(probeAt_);
-  if (!connection_ && (!waiters_.empty() || !queue_.empty())) consider(nextAttempt_);
+  const auto consider = [&next](std::optional<Time> time) {
+    if (time) next = std::min(next.value_or(*time), *time);
+  };
+  consider(publisher_.firstDeadline());
+  if (state_ == State::kConnected) consider(publisher_.probeTime());
+  if (!hasConnection() && isNeeded()) consider(nextAttempt_);
   return next;
 }
 
@@ -254,42 +237,45 @@ void NatsLink::run() {
       step = nextStep(std::chrono::steady_clock::now());
       if (step == Step::kWait) waitForChange();
     }
-    switch (step) {
-      case Step::kWait:
-        break;
-      case Step::kTell:
-        tellAnswers();
-        break;
-      case Step::kAnswer:
-        answerWaiters();
-        break;
-      case Step::kConnect:
-        connect();
-        break;
-      case Step::kProbe:
-        probe();
-        break;
-      case Step::kSend:
-        publishSome();
-        break;
-      case Step::kGiveUp:
-        giveUpOverdue();
-        break;
-      case Step::kDrop:
-        dropConnection();
-        break;
-      case Step::kEnd:
-        end();
-        return;
-    }
+    if (!perform(step)) return;
   }
+}
+
+bool NatsLink::perform(Step step) {
+  switch (step) {
+    case Step::kWait:
+      break;
+    case Step::kTell:
+      tellAnswers();
+      break;
+    case Step::kAnswer:
+      answerWaiters();
+      break;
+    case Step::kConnect:
+      connect();
+      break;
+    case Step::kPublish:
+      publisher_.publishNext();
+      break;
+    case Step::kAbandon:
+      publisher_.abandonOverdue();
+      break;
+    case Step::kDrop:
+      dropConnection();
+      break;
+    case Step::kEnd:
+      end();
+      return false;
+  }
+  return true;
 }
 
 void NatsLink::end() {
   {
-    // A library that looks for its server lets nobody close the connection in between.
+    // The library cannot close a connection while it tries to reconnect, because it holds the lock
+    // of the connection: dropConnection() may then hang.
     const MutexLock lock(mutex_);
-    if (!isConnected_) leaveBy_ = std::chrono::steady_clock::now() + kAttemptEndTime;
+    if (state_ != State::kConnected) leaveBy_ = std::chrono::steady_clock::now() + kAttemptEndTime;
     changed_.notifyAll();
   }
   drain();
@@ -301,20 +287,19 @@ void NatsLink::end() {
   changed_.notifyAll();
 }
 
-// Those that wait for servers learn of them, or that there are none.
+// Calls back everybody who asked: with the servers, or with nothing when none is connected.
 void NatsLink::answerWaiters() {
   std::vector<Waiter> waiters;
   std::optional<Array> servers;
   {
     const MutexLock lock(mutex_);
     waiters.swap(waiters_);
-    if (isConnected_) servers = servers_;
+    if (state_ == State::kConnected) servers = servers_;
   }
   tellAnswers();
   for (const Waiter& waiter : waiters) waiter.found(servers);
 }
 
-// Those that asked while there was a server.
 void NatsLink::tellAnswers() {
   std::vector<Answer> answers;
   {

@@ -4,46 +4,38 @@
 
 #include "platform/linux/link/nats/NatsLink.h"
 #include "platform/linux/link/nats/NatsLog.h"
+#include "platform/linux/link/nats/NatsStream.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
-// One server that accepts and says nothing may take so much of an attempt, all of them together
-// kServersTime, so that the attempt ends before those who wait for it have given up.
+// The library tries one server after the other, and one that accepts and stays silent takes its
+// whole time-out. All servers together get kServersTime and the stream two requests, 7.5 seconds:
+// the attempt ends before the callers of discover() give up (kDiscoveryTime).
 constexpr std::chrono::milliseconds kServerTime{2000};
+constexpr std::chrono::milliseconds kShortestServerTime{100};
 constexpr std::chrono::milliseconds kServersTime{6000};
-constexpr std::chrono::milliseconds kRequestTime{750};  // up to two for the stream
+constexpr std::chrono::milliseconds kRequestTime{750};
+static_assert(kServersTime + 2 * kRequestTime < NatsLink::kDiscoveryTime);
+// A server that does not read for this long is treated as gone; close() can wait for one write.
 constexpr std::chrono::milliseconds kWriteTime{2000};
+// Reconnects quickly after a restart of a server; the jitter spreads the services of a fleet.
 constexpr std::chrono::milliseconds kReconnectPause{250};
 constexpr std::chrono::milliseconds kReconnectJitter{250};
+// A server that vanished without closing the connection is noticed within a minute. The wake-ups of
+// shorter pings would cost more than they tell: a missing acknowledgement tells sooner.
 constexpr std::chrono::milliseconds kPingPause{20'000};
 constexpr int kLostPings = 2;
 constexpr int kForEver = -1;
 
-// What the stream keeps when this service makes it. Whoever wants other limits makes it first.
-constexpr std::int64_t kStreamBytes = std::int64_t{4} << 30;
-constexpr std::chrono::nanoseconds kStreamAge = std::chrono::hours(24 * 30);
-// For so long the stream knows its messages again; whatever is published again is so within half of
-// it.
-constexpr std::chrono::nanoseconds kDuplicatesTime = std::chrono::minutes(2);
-static_assert(kDuplicatesTime >= 2 * NatsLink::kAckTime);
-
-// The library shall keep nothing while the servers are away, see NatsLink. It does so with 0,
-// unlike what it says of itself; with 1 byte it keeps a whole message.
+// While servers are away the library must buffer nothing: its buffer would overtake the messages
+// that were on their way, see NatsPublisher. 0 disables the buffer, although the library documents
+// 0 as its default size; with 1 byte it buffers a whole message.
 constexpr int kReconnectBufferBytes = 0;
 constexpr std::chrono::milliseconds kDrainTime{1000};
-
-std::string describe(natsStatus status) {
-  natsStatus last = NATS_OK;
-  const char* const detail = nats_GetLastError(&last);
-  std::string text = natsStatus_GetText(status);
-  if (last == status && detail != nullptr && *detail != '\0' && text != detail) {
-    text += std::string(" (") + detail + ")";
-  }
-  return text;
-}
+static_assert(2 * kDrainTime + kWriteTime < NatsLink::kConnectionEndTime);
 
 Array serversOf(natsConnection* connection) {
   char** urls = nullptr;
@@ -58,16 +50,14 @@ Array serversOf(natsConnection* connection) {
   return Array(std::span<const Value>(values));
 }
 
-}  // namespace
-
-natsStatus NatsLink::secure(natsOptions* options) {
-  if (!options_.credentials.empty()) {
+natsStatus secure(natsOptions* options, const Configuration::Link& link) {
+  if (!link.credentials.empty()) {
     const natsStatus status =
-        natsOptions_SetUserCredentialsFromFiles(options, options_.credentials.c_str(), nullptr);
+        natsOptions_SetUserCredentialsFromFiles(options, link.credentials.c_str(), nullptr);
     if (status != NATS_OK) return status;
   }
-  if (!options_.tls) return NATS_OK;
-  const Configuration::Link::Tls& tls = *options_.tls;
+  if (!link.tls) return NATS_OK;
+  const Configuration::Link::Tls& tls = *link.tls;
   natsStatus status = natsOptions_SetSecure(options, true);
   if (status == NATS_OK && !tls.ca.empty()) {
     status = natsOptions_LoadCATrustedCertificates(options, tls.ca.c_str());
@@ -80,6 +70,8 @@ natsStatus NatsLink::secure(natsOptions* options) {
   }
   return status;
 }
+
+}  // namespace
 
 natsStatus NatsLink::configure(natsOptions* options) {
   std::vector<const char*> urls;
@@ -95,12 +87,14 @@ natsStatus NatsLink::configure(natsOptions* options) {
   const auto closed = [](natsConnection* connection, void* link) {
     static_cast<NatsLink*>(link)->onClosed(connection);
   };
-  // Errors without a message of ours to blame are told by what becomes of the messages.
+  // The default handler prints to stderr. What matters of these errors shows in the
+  // acknowledgements.
   const auto ignore = [](natsConnection*, natsSubscription*, natsStatus, void*) {};
   for (const natsStatus status :
        {natsOptions_SetServers(options, urls.data(), static_cast<int>(urls.size())),
         natsOptions_SetName(options, "halvox-reportingd"),
-        natsOptions_SetTimeout(options, std::max<std::int64_t>(timeout, 100)),
+        natsOptions_SetTimeout(options,
+                               std::max<std::int64_t>(timeout, kShortestServerTime.count())),
         natsOptions_SetAllowReconnect(options, true),
         natsOptions_SetMaxReconnect(options, kForEver),
         natsOptions_SetReconnectWait(options, kReconnectPause.count()),
@@ -116,63 +110,11 @@ natsStatus NatsLink::configure(natsOptions* options) {
         natsOptions_SetClosedCB(options, closed, this)}) {
     if (status != NATS_OK) return status;
   }
-  return secure(options);
+  return secure(options, options_);
 }
 
-std::string NatsLink::provideStream(jsCtx* context) {
-  JetStreamInfo info;
-  jsErrCode code{};
-  natsStatus status =
-      js_GetStreamInfo(info.out(), context, options_.stream.c_str(), nullptr, &code);
-  ackTime_ = kAckTime;
-  if (status == NATS_OK) {  // as it is, whatever it was made for
-    const std::chrono::nanoseconds duplicates(info.get()->Config->Duplicates);
-    ackTime_ = std::min<std::chrono::nanoseconds>(kAckTime, duplicates / 2);
-    return {};
-  }
-  if (status != NATS_NOT_FOUND && code != JSStreamNotFoundErr) {
-    return "stream " + options_.stream + ": " + describe(status);
-  }
-  const std::string subjects = options_.subject + ".>";
-  const char* subject = subjects.c_str();
-  jsStreamConfig stream;
-  jsStreamConfig_Init(&stream);
-  stream.Name = options_.stream.c_str();
-  stream.Subjects = &subject;
-  stream.SubjectsLen = 1;
-  stream.Storage = js_FileStorage;
-  stream.MaxBytes = kStreamBytes;
-  stream.MaxAge = kStreamAge.count();
-  stream.Replicas = static_cast<std::int64_t>(options_.replicas);
-  stream.Duplicates = kDuplicatesTime.count();
-  status = js_AddStream(info.out(), context, &stream, nullptr, &code);
-  if (status == NATS_OK) kLog.notice("made the stream ", options_.stream);
-  // Another service may have made it in the meantime.
-  if (status == NATS_OK || code == JSStreamNameExistErr) return {};
-  return "stream " + options_.stream + " cannot be made: " + describe(status);
-}
-
-// Nobody takes messages while the stream has no leader, but neither when there is none any more: it
-// was deleted, or its server lost its files.
-void NatsLink::provideStreamAgain() {
-  const Time now = std::chrono::steady_clock::now();
-  {
-    const MutexLock lock(mutex_);
-    if (!isStreamInDoubt_ || now < nextStreamCheck_) return;
-    isStreamInDoubt_ = false;
-  }
-  const std::string failure = provideStream(context_.get());
-  nextStreamCheck_ = std::chrono::steady_clock::now() + kStreamCheckPause;
-  if (failure.empty()) return;
-  std::optional<std::uint64_t> worthALine;
-  {
-    const MutexLock lock(mutex_);
-    worthALine = attemptLog_.note(1, now);
-  }
-  if (worthALine) kLog.error("no server of the link takes messages: ", failure);
-}
-
-// Why it failed; empty on success.
+// Returns why it failed; empty on success. On failure the caller closes `connection`, if there is
+// one.
 std::string NatsLink::open(NatsConnection& connection, JetStreamContext& context) {
   NatsOptionsHandle options;
   natsStatus status = natsOptions_Create(options.out());
@@ -182,95 +124,95 @@ std::string NatsLink::open(NatsConnection& connection, JetStreamContext& context
   jsOptions streaming;
   jsOptions_Init(&streaming);
   streaming.Wait = kRequestTime.count();
-  streaming.PublishAsync.AckHandler = onAcknowledged;
-  streaming.PublishAsync.AckHandlerClosure = this;
+  streaming.PublishAsync.AckHandler = NatsPublisher::onAcknowledged;
+  streaming.PublishAsync.AckHandlerClosure = &publisher_;
   status = natsConnection_JetStream(context.out(), connection.get(), &streaming);
   if (status != NATS_OK) return describe(status);
-  return provideStream(context.get());
+  StreamProvision provision = provideStream(context.get(), options_);
+  if (provision.failure.empty()) publisher_.attach(context.get(), provision.duplicates);
+  return std::move(provision.failure);
 }
 
 void NatsLink::connect() {
   {
     const MutexLock lock(mutex_);
     if (closeBy_) return;
-    isConnecting_ = true;
+    state_ = State::kConnecting;
   }
   NatsConnection connection;
   JetStreamContext context;
-  std::string failure = open(connection, context);
-  if (failure.empty()) {
-    natsConnection* const opened = connection.get();
-    {
-      const MutexLock lock(mutex_);
-      endAttempt();
-      connection_ = std::move(connection);
-      context_ = std::move(context);
-      lastFailure_.clear();
-      isLost_ = natsConnection_IsClosed(opened);
-    }
-    kLog.notice("the link is connected");
-    return onAvailable(opened);
+  const std::string failure = open(connection, context);
+  if (!failure.empty()) {
+    if (connection) natsConnection_Close(connection.get());
+    return failAttempt(failure);
   }
-  if (connection) natsConnection_Close(connection.get());
-  std::deque<OutgoingMessage> unsent;
+  natsConnection* const opened = connection.get();
+  {
+    const MutexLock lock(mutex_);
+    // Callbacks were ignored until here, because connection_ was another.
+    endAttempt(natsConnection_IsClosed(opened) ? State::kLost : State::kAway);
+    connection_ = std::move(connection);
+    context_ = std::move(context);
+    lastFailure_.clear();
+  }
+  kLog.notice("the link is connected");
+  onAvailable(opened);
+}
+
+// What waits for a server fails with the attempt: to keep it would only delay the error.
+void NatsLink::failAttempt(const std::string& failure) {
   std::optional<std::uint64_t> worthALine;
   {
     const MutexLock lock(mutex_);
-    endAttempt();
+    const Time now = std::chrono::steady_clock::now();
+    endAttempt(State::kIdle);
     lastFailure_ = failure;
-    nextAttempt_ = std::chrono::steady_clock::now() + kAttemptPause;
-    unsent.swap(queue_);
-    queuedBytes_ = 0;
-    worthALine = attemptLog_.note(1, std::chrono::steady_clock::now());
+    nextAttempt_ = now + kAttemptPause;
+    worthALine = attemptLog_.note(1, now);
   }
   if (worthALine) kLog.error("no server of the link was reached: ", failure);
-  fail(unsent, "no server");
+  publisher_.failQueued("no server");
   answerWaiters();
 }
 
-// From here on the thread does nothing that takes longer than close() has time for.
-void NatsLink::endAttempt() {
-  isConnecting_ = false;
+// After an attempt the thread does nothing that takes longer than close() allows.
+void NatsLink::endAttempt(State state) {
+  state_ = state;
   if (closeBy_) leaveBy_ = *closeBy_ + kConnectionEndTime;
 }
 
-// Lets the library's threads return from all calls of ours. Ended before that, it leaves a message
-// behind which one of them was about to free.
+// Lets the library's threads return from our callbacks. If the library ends while one of them still
+// runs, the message that the callback was about to free leaks.
 void NatsLink::drain() {
   natsConnection* const connection = connection_.get();
   {
     const MutexLock lock(mutex_);
-    if (connection == nullptr || !isConnected_) return;
+    if (connection == nullptr || state_ != State::kConnected) return;
   }
   if (natsConnection_Status(connection) != NATS_CONN_STATUS_CONNECTED) return;
   if (natsConnection_DrainTimeout(connection, kDrainTime.count()) != NATS_OK) return;
   const Time end = std::chrono::steady_clock::now() + 2 * kDrainTime;
   const MutexLock lock(mutex_);
-  while (!isLost_ && std::chrono::steady_clock::now() < end) changed_.waitUntil(mutex_, end);
+  while (state_ != State::kLost && std::chrono::steady_clock::now() < end)
+    changed_.waitUntil(mutex_, end);
 }
 
 void NatsLink::dropConnection() {
   NatsConnection connection;
   JetStreamContext context;
-  std::vector<PendingAcks::Entry> lost;
-  std::deque<OutgoingMessage> unsent;
+  bool isEnding = false;
   {
     const MutexLock lock(mutex_);
     connection = std::move(connection_);
     context = std::move(context_);
-    isConnected_ = false;
-    isLost_ = false;
-    isWindowFull_ = false;
-    flow_ = Flow::kFlowing;
-    isStreamInDoubt_ = false;
+    state_ = State::kIdle;
     maxPayload_ = 0;
     servers_ = Array();
-    lost = pending_.takeAll();
-    if (closeBy_) unsent.swap(queue_);
+    isEnding = closeBy_.has_value();
   }
-  // First, because the library may keep the thread until a server speaks.
-  abandon(lost, "the connection ended");
-  fail(unsent, "the service ended");
+  // Before the connection is closed, because that can hang until a server answers.
+  publisher_.detach();
+  if (isEnding) publisher_.failQueued("the service ended");
   if (connection) natsConnection_Close(connection.get());
   context.reset();
   connection.reset();
@@ -281,8 +223,8 @@ void NatsLink::onAvailable(natsConnection* connection) {
   const std::int64_t maxPayload = natsConnection_GetMaxPayload(connection);
   const bool isConnected = natsConnection_Status(connection) == NATS_CONN_STATUS_CONNECTED;
   const MutexLock lock(mutex_);
-  if (connection != connection_.get() || !isConnected) return;
-  isConnected_ = true;
+  if (connection != connection_.get() || !isConnected || state_ == State::kLost) return;
+  state_ = State::kConnected;
   servers_ = servers;
   maxPayload_ = static_cast<std::size_t>(std::max<std::int64_t>(maxPayload, 0));
   changed_.notifyAll();
@@ -292,8 +234,8 @@ void NatsLink::onAway(natsConnection* connection) {
   {
     const MutexLock lock(mutex_);
     if (connection != connection_.get()) return;
-    isConnected_ = false;
-    beginHolding(std::chrono::steady_clock::now());
+    if (state_ == State::kConnected) state_ = State::kAway;
+    publisher_.holdAfterLoss();
     changed_.notifyAll();
   }
   kLog.notice("the link lost its server and looks for it");
@@ -302,8 +244,7 @@ void NatsLink::onAway(natsConnection* connection) {
 void NatsLink::onClosed(natsConnection* connection) {
   const MutexLock lock(mutex_);
   if (connection != connection_.get()) return;
-  isConnected_ = false;
-  isLost_ = true;
+  state_ = State::kLost;
   changed_.notifyAll();
 }
 

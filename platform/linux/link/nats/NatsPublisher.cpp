@@ -1,0 +1,387 @@
+#include "platform/linux/link/nats/NatsPublisher.h"
+
+#include <algorithm>
+#include <utility>
+
+#include "platform/linux/link/nats/NatsLog.h"
+#include "platform/linux/link/nats/NatsStream.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog(natsLogCategory, "NatsLink");
+
+constexpr std::string_view kErrorDomain = "com.tarno.halvox.link";
+
+// Messages taken from the queue under one hold of the lock. The library is called without the
+// lock; senders would otherwise wait while it writes.
+constexpr std::size_t kMessagesAtOnce = 64;
+
+// Without an acknowledgement in this time a message counts as lost. Much longer than a busy server
+// needs, and short enough for a second attempt within the 5 seconds of a flush.
+constexpr std::chrono::milliseconds kAttemptTime{3000};
+constexpr std::chrono::milliseconds kProbeTime{1000};
+
+// Whether another attempt can succeed where this one failed.
+bool isTemporary(natsStatus status, jsErrCode code = {}) {
+  switch (status) {
+    case NATS_NO_RESPONDERS:
+    case NATS_TIMEOUT:
+    case NATS_INSUFFICIENT_BUFFER:
+    case NATS_CONNECTION_CLOSED:
+    case NATS_CONNECTION_DISCONNECTED:
+    case NATS_IO_ERROR:
+    case NATS_STALE_CONNECTION:
+      return true;
+    default:  // a status of the library, which gains some
+      return code == JSClusterNotAvailErr || code == JSClusterNotLeaderErr;
+  }
+}
+
+}  // namespace
+
+NatsPublisher::NatsPublisher(const Configuration::Link& options, StatisticsService& statistics,
+                             std::function<void()> wake)
+    : options_(options),
+      statistics_(statistics),
+      wake_(std::move(wake)),
+      received_(statistics_.counter(kNatsPiece, "received")),
+      acknowledged_(statistics_.counter(kNatsPiece, "acknowledged")),
+      notAcknowledged_(statistics_.counter(kNatsPiece, "not acknowledged")),
+      publishedAgain_(statistics_.counter(kNatsPiece, "published again")) {}
+
+std::optional<Error> NatsPublisher::take(OutgoingMessage& message) {
+  const MutexLock lock(mutex_);
+  if (queuedBytes_ + message.bytes > kQueueBytes) {
+    return refusedByLink("no room: " + std::to_string(queue_.size()) +
+                         " messages wait for the server");
+  }
+  queuedBytes_ += message.bytes;
+  queue_.push_back(std::move(message));
+  return std::nullopt;
+}
+
+void NatsPublisher::refuse(const OutgoingMessage& message) {
+  statistics_.counter(kNatsPiece, "failed: refused").add();
+  if (message.ledger) message.ledger->resolve(message.number, AckOutcome::kRefused);
+}
+
+void NatsPublisher::beginEnd() {
+  const MutexLock lock(mutex_);
+  isEnding_ = true;
+}
+
+std::deque<OutgoingMessage> NatsPublisher::takeQueue() {
+  queuedBytes_ = 0;
+  return std::exchange(queue_, {});
+}
+
+void NatsPublisher::abandonAll() {
+  std::vector<PendingAcks::Entry> lost;
+  std::deque<OutgoingMessage> unsent;
+  {
+    const MutexLock lock(mutex_);
+    lost = pending_.takeAll();
+    unsent = takeQueue();
+  }
+  abandon(lost, "the connection ended");
+  fail(unsent, "the service ended");
+}
+
+void NatsPublisher::attach(jsCtx* context, std::chrono::nanoseconds duplicates) {
+  context_ = context;
+  ackTime_ = std::min<std::chrono::nanoseconds>(kAckTime, duplicates / 2);
+}
+
+void NatsPublisher::detach() {
+  std::vector<PendingAcks::Entry> lost;
+  {
+    const MutexLock lock(mutex_);
+    isWindowFull_ = false;
+    flow_ = Flow::kFlowing;
+    isStreamInDoubt_ = false;
+    lost = pending_.takeAll();
+  }
+  context_ = nullptr;
+  abandon(lost, "the connection ended");
+}
+
+void NatsPublisher::failQueued(std::string_view reason) {
+  std::deque<OutgoingMessage> unsent;
+  {
+    const MutexLock lock(mutex_);
+    unsent = takeQueue();
+  }
+  fail(unsent, reason);
+}
+
+bool NatsPublisher::hasQueued() {
+  const MutexLock lock(mutex_);
+  return !queue_.empty();
+}
+
+bool NatsPublisher::isDone() {
+  const MutexLock lock(mutex_);
+  return queue_.empty() && pending_.size() == 0;
+}
+
+std::optional<NatsPublisher::Time> NatsPublisher::firstDeadline() {
+  const MutexLock lock(mutex_);
+  return pending_.firstDeadline();
+}
+
+std::optional<NatsPublisher::Time> NatsPublisher::probeTime() {
+  const MutexLock lock(mutex_);
+  if (flow_ != Flow::kHolding) return std::nullopt;
+  return probeAt_;
+}
+
+bool NatsPublisher::canPublish(Time now) {
+  const MutexLock lock(mutex_);
+  return nextStep(now) != Step::kWait;
+}
+
+NatsPublisher::Step NatsPublisher::nextStep(Time now) {
+  // Half a window at a time: to wake the thread for every acknowledgement costs more than the
+  // acknowledgement itself.
+  if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
+  if (pending_.size() == 0) flow_ = Flow::kFlowing;
+  if (flow_ == Flow::kProbing) return Step::kWait;
+  if (flow_ == Flow::kHolding) return now >= probeAt_ ? Step::kProbe : Step::kWait;
+  if (pending_.needsAgain()) return pending_.hasAgain() ? Step::kSend : Step::kWait;
+  return !queue_.empty() && !isWindowFull_ ? Step::kSend : Step::kWait;
+}
+
+// Decides anew: an acknowledgement may have come since canPublish().
+void NatsPublisher::publishNext() {
+  Step step = Step::kWait;
+  {
+    const MutexLock lock(mutex_);
+    step = nextStep(std::chrono::steady_clock::now());
+  }
+  switch (step) {
+    case Step::kWait:
+      return;
+    case Step::kProbe:
+      return probe();
+    case Step::kSend:
+      return publishSome();
+  }
+}
+
+// Registers the messages as pending before they are published: an acknowledgement can arrive before
+// the call that publishes has returned.
+std::vector<NatsMessage> NatsPublisher::takeSome() {
+  std::vector<NatsMessage> taken;
+  taken.reserve(kMessagesAtOnce);
+  while (taken.size() < kMessagesAtOnce && pending_.hasAgain()) {
+    taken.push_back(pending_.nextAgain());
+  }
+  publishedAgain_.add(taken.size());
+  const Time deadline = std::chrono::steady_clock::now() +
+                        std::chrono::duration_cast<std::chrono::steady_clock::duration>(ackTime_);
+  while (!queue_.empty() && taken.size() < kMessagesAtOnce && pending_.hasRoom() &&
+         !pending_.needsAgain()) {
+    OutgoingMessage& next = queue_.front();
+    queuedBytes_ -= next.bytes;
+    pending_.add(next.message.get(), {std::move(next.ledger), next.number, next.bytes, deadline});
+    taken.push_back(std::move(next.message));
+    queue_.pop_front();
+  }
+  isWindowFull_ = !pending_.hasRoom();
+  return taken;
+}
+
+void NatsPublisher::publishSome() {
+  std::vector<NatsMessage> messages;
+  {
+    const MutexLock lock(mutex_);
+    messages = takeSome();
+  }
+  publish(std::move(messages), kAttemptTime);
+}
+
+void NatsPublisher::probe() {
+  provideStreamAgain();
+  reclaim();
+  std::vector<NatsMessage> messages;
+  {
+    const MutexLock lock(mutex_);
+    pending_.beginAgain();
+    if (!pending_.hasAgain()) {  // settled, or about to be by a callback
+      probeAt_ = std::chrono::steady_clock::now() + kResendPause;
+      return;
+    }
+    flow_ = Flow::kProbing;
+    messages.push_back(pending_.nextAgain());
+  }
+  publishedAgain_.add();
+  publish(std::move(messages), kProbeTime);
+}
+
+// Looks for the stream, which may be gone rather than without a leader: both look the same to a
+// publisher. Not with every probe, see kStreamCheckPause.
+void NatsPublisher::provideStreamAgain() {
+  const Time now = std::chrono::steady_clock::now();
+  {
+    const MutexLock lock(mutex_);
+    if (!isStreamInDoubt_ || now < nextStreamCheck_) return;
+    isStreamInDoubt_ = false;
+  }
+  const StreamProvision provision = provideStream(context_, options_);
+  nextStreamCheck_ = std::chrono::steady_clock::now() + kStreamCheckPause;
+  ackTime_ = std::min<std::chrono::nanoseconds>(kAckTime, provision.duplicates / 2);
+  if (provision.failure.empty() || !streamLog_.note(1, now)) return;
+  kLog.error("no server of the link takes messages: ", provision.failure);
+}
+
+// Takes back from the library the messages that it still awaits acknowledgements for, to publish
+// them again in order. It would otherwise time out each of them by itself.
+void NatsPublisher::reclaim() {
+  natsMsgList list{};
+  if (js_PublishAsyncGetPendingList(&list, context_) != NATS_OK) return;
+  {
+    const MutexLock lock(mutex_);
+    for (natsMsg*& message : std::span(list.Msgs, static_cast<std::size_t>(list.Count))) {
+      (void)pending_.giveBack(NatsMessage(std::exchange(message, nullptr)));
+    }
+  }
+  natsMsgList_Destroy(&list);
+}
+
+void NatsPublisher::publish(std::vector<NatsMessage> messages, std::chrono::milliseconds patience) {
+  jsPubOptions publishing;
+  jsPubOptions_Init(&publishing);
+  publishing.MaxWait = patience.count();
+  for (std::size_t index = 0; index < messages.size(); ++index) {
+    natsMsg* raw = messages[index].release();
+    natsMsg* const key = raw;
+    const natsStatus status = js_PublishMsgAsync(context_, &raw, &publishing);
+    if (status == NATS_OK) continue;
+    messages[index].reset(raw);
+    if (isTemporary(status)) {
+      return hold(std::span(messages).subspan(index), status);
+    }
+    const jsPubAckErr error{.Msg = key, .Err = status, .ErrCode = {}, .ErrText = nullptr};
+    resolve(std::move(messages[index]), &error);
+  }
+}
+
+// Keeps messages whose attempt failed for another attempt.
+void NatsPublisher::hold(std::span<NatsMessage> messages, natsStatus status) {
+  std::optional<std::uint64_t> worthALine;
+  {
+    const MutexLock lock(mutex_);
+    bool isKnown = flow_ == Flow::kProbing;
+    for (NatsMessage& message : messages) {
+      isKnown = pending_.giveBack(std::move(message)) || isKnown;
+    }
+    if (!isKnown || flow_ == Flow::kHolding) return;
+    const Time now = std::chrono::steady_clock::now();
+    if (flow_ == Flow::kProbing && status == NATS_NO_RESPONDERS) isStreamInDoubt_ = true;
+    beginHolding(now + kResendPause);
+    worthALine = holdLog_.note(1, now);
+  }
+  wake_();
+  if (worthALine)
+    kLog.notice("messages of the link wait to be published again: ", natsStatus_GetText(status));
+}
+
+void NatsPublisher::holdAfterLoss() {
+  const MutexLock lock(mutex_);
+  beginHolding(std::chrono::steady_clock::now());
+}
+
+void NatsPublisher::beginHolding(Time until) {
+  if (pending_.size() == 0) return;
+  flow_ = Flow::kHolding;
+  probeAt_ = until;
+}
+
+void NatsPublisher::abandonOverdue() {
+  std::vector<PendingAcks::Entry> overdue;
+  {
+    const MutexLock lock(mutex_);
+    overdue = pending_.takeOverdue(std::chrono::steady_clock::now());
+  }
+  abandon(overdue, "no acknowledgement in time");
+}
+
+void NatsPublisher::onAcknowledged(jsCtx*, natsMsg* message, jsPubAck*, jsPubAckErr* error,
+                                   void* publisher) {
+  NatsMessage owned(message);
+  auto& self = *static_cast<NatsPublisher*>(publisher);
+  if (error != nullptr && isTemporary(error->Err, error->ErrCode)) {
+    return self.hold(std::span(&owned, 1), error->Err);
+  }
+  self.resolve(std::move(owned), error);
+}
+
+void NatsPublisher::resolve(NatsMessage message, const jsPubAckErr* error) {
+  std::optional<PendingAcks::Entry> entry;
+  bool isAwaited = false;
+  {
+    const MutexLock lock(mutex_);
+    entry = pending_.take(message.get());
+    // Freed here: once the thread sees that nothing is pending, it may end the library, which must
+    // not happen before the message is destroyed.
+    message.reset();
+    const bool isProbed = flow_ == Flow::kProbing;
+    if (isProbed) flow_ = Flow::kFlowing;
+    isAwaited = isProbed || pending_.needsAgain() || (isWindowFull_ && pending_.isHalfFree()) ||
+                (isEnding_ && pending_.size() == 0);
+  }
+  if (isAwaited) wake_();
+  if (entry) settle(*entry, error);  // none for a message that was abandoned before
+}
+
+void NatsPublisher::settle(const PendingAcks::Entry& entry, const jsPubAckErr* error) {
+  if (error == nullptr) {
+    acknowledged_.add();
+  } else {
+    const std::string_view reason = natsStatus_GetText(error->Err);
+    countFailure(1, error->ErrText != nullptr ? error->ErrText : reason);
+    statistics_.counter(kNatsPiece, std::string("failed: ") + std::string(reason)).add();
+  }
+  if (!entry.ledger) return;
+  entry.ledger->resolve(entry.number,
+                        error == nullptr ? AckOutcome::kAcknowledged : AckOutcome::kFailed);
+}
+
+void NatsPublisher::countFailure(std::uint64_t messages, std::string_view reason) {
+  std::optional<std::uint64_t> worthALine;
+  {
+    const MutexLock lock(mutex_);
+    worthALine = failureLog_.note(messages, std::chrono::steady_clock::now());
+  }
+  if (worthALine) {
+    kLog.error("messages of the link that no server confirmed: ", *worthALine,
+               ", the last: ", reason);
+  }
+}
+
+void NatsPublisher::abandon(const std::vector<PendingAcks::Entry>& entries,
+                            std::string_view reason) {
+  if (entries.empty()) return;
+  notAcknowledged_.add(entries.size());
+  countFailure(entries.size(), reason);
+  for (const PendingAcks::Entry& entry : entries) {
+    if (entry.ledger) entry.ledger->resolve(entry.number, AckOutcome::kFailed);
+  }
+}
+
+void NatsPublisher::fail(const std::deque<OutgoingMessage>& messages, std::string_view reason) {
+  if (messages.empty()) return;
+  statistics_.counter(kNatsPiece, std::string("failed: ") + std::string(reason))
+      .add(messages.size());
+  countFailure(messages.size(), reason);
+  for (const OutgoingMessage& message : messages) {
+    if (message.ledger) message.ledger->resolve(message.number, AckOutcome::kFailed);
+  }
+}
+
+Error refusedByLink(std::string description) {
+  return {.domain = std::string(kErrorDomain), .code = 1, .description = std::move(description)};
+}
+
+}  // namespace halvox::platform::linux_

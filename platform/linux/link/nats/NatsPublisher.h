@@ -1,0 +1,174 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/linux/base/Mutex.h"
+#include "platform/linux/link/nats/AckLedger.h"
+#include "platform/linux/link/nats/BurstLog.h"
+#include "platform/linux/link/nats/NatsHandles.h"
+#include "platform/linux/link/nats/NatsTlmReporting.h"
+#include "platform/linux/link/nats/PendingAcks.h"
+
+namespace halvox::platform::linux_ {
+
+// A message before the client library has it.
+struct OutgoingMessage {
+  NatsMessage message;
+  std::size_t bytes = 0;              // body and headers
+  std::shared_ptr<AckLedger> ledger;  // null when no flush waits for the message
+  AckLedger::Number number = 0;
+};
+
+// Publishes messages in order over a connection that NatsLink makes and ends, and accounts for
+// every message: received = acknowledged + not acknowledged + failed, by reason.
+//
+//   flowing --no responders, no acknowledgement, connection lost--> holding
+//      ^                                                            |     ^
+//      +--- acknowledged --- probing <--- kResendPause later -------+     |
+//                               +------------- failed --------------------+
+//
+//   flowing: messages leave the queue while the acknowledgement window has room.
+//   holding: nothing is published.
+//   probing: the oldest unacknowledged message was published again, alone. Its acknowledgement
+//            lets all later unacknowledged messages follow in order, and then the queue.
+//
+// One probe first, because messages published while a cluster elects a leader are dropped at
+// random, and the rest would overtake them. The stream confirms a message that it already has, by
+// its identifier, without storing it twice. This keeps the order of a session's messages even when
+// the leader of the stream is lost. One exception: if the leader changes faster than a message
+// travels to the server and back, a later message can be stored before an earlier one.
+//
+// A probe that nobody responds to can mean that the stream was deleted or that its server lost its
+// files. The publisher then creates the stream again. A message without an acknowledgement within
+// kAckTime of its first attempt is abandoned and counted as not acknowledged.
+//
+// Threads: take(), refuse() and beginEnd() may be called by any thread, the next group by any
+// thread for reading; everything below "the link's thread only" by that thread alone. Library
+// threads call onAcknowledged(). Only the link's thread ever waits for a server. `wake` is called
+// without a lock of this class held, and may lock the owner; so the owner may call any function
+// with its own lock held unless that function publishes.
+// Owner: NatsLink, which keeps the publisher until the library has ended.
+class NatsPublisher {
+ public:
+  using Time = std::chrono::steady_clock::time_point;
+
+  // An election in a cluster takes seconds, a restart of a server up to half a minute. Also half
+  // of the shortest time for which our streams recognise identifiers, with reserve.
+  static constexpr std::chrono::seconds kAckTime{30};
+  // Long enough not to load a cluster that elects a leader, short beside the election itself.
+  static constexpr std::chrono::milliseconds kResendPause{100};
+  // A lookup of the stream is a request to all servers of a cluster; probes come every
+  // kResendPause.
+  static constexpr std::chrono::seconds kStreamCheckPause{2};
+  // What waits while servers are away. The largest request of a client fits (32 MiB), and more
+  // than 30,000 ordinary messages of 1 KiB do: 30 seconds of a busy service. More would only delay
+  // the error that tells a client's session that the link is broken.
+  static constexpr std::size_t kQueueBytes = 32U << 20U;
+
+  // `wake` makes the link's thread look for work again.
+  NatsPublisher(const Configuration::Link& options, StatisticsService& statistics,
+                std::function<void()> wake);
+  NatsPublisher(const NatsPublisher&) = delete;
+  NatsPublisher& operator=(const NatsPublisher&) = delete;
+  ~NatsPublisher() = default;
+
+  // Counts a message that a session sends, before it is taken or refused.
+  void countReceived() { received_.add(); }
+  // Queues the message and moves from it; or says why not and leaves it as it is.
+  [[nodiscard]] std::optional<Error> take(OutgoingMessage& message) HALVOX_EXCLUDES(mutex_);
+  // Accounts for a message that nobody took; its sender gets the error.
+  void refuse(const OutgoingMessage& message);
+  // From here on `wake` is also called when the last acknowledgement has come.
+  void beginEnd() HALVOX_EXCLUDES(mutex_);
+  // Abandons everything, queued or unacknowledged.
+  void abandonAll() HALVOX_EXCLUDES(mutex_);
+
+  [[nodiscard]] bool hasQueued() HALVOX_EXCLUDES(mutex_);
+  // Whether nothing is queued and nothing awaits its acknowledgement.
+  [[nodiscard]] bool isDone() HALVOX_EXCLUDES(mutex_);
+  // When the oldest unacknowledged message is abandoned; none without such a message.
+  [[nodiscard]] std::optional<Time> firstDeadline() HALVOX_EXCLUDES(mutex_);
+  // When the next probe is due; none unless holding.
+  [[nodiscard]] std::optional<Time> probeTime() HALVOX_EXCLUDES(mutex_);
+  // Whether publishNext() would publish, provided that a server is connected.
+  [[nodiscard]] bool canPublish(Time now) HALVOX_EXCLUDES(mutex_);
+
+  // The link's thread only.
+  // Publishes over `context` until detach(). The caller owns `context`.
+  void attach(jsCtx* context, std::chrono::nanoseconds duplicates);
+  void publishNext() HALVOX_EXCLUDES(mutex_);
+  void abandonOverdue() HALVOX_EXCLUDES(mutex_);
+  // Fails what is queued: no server could be reached.
+  void failQueued(std::string_view reason) HALVOX_EXCLUDES(mutex_);
+  // The connection has ended: abandons what is unacknowledged. The queue stays for the next one.
+  void detach() HALVOX_EXCLUDES(mutex_);
+
+  // Any thread. The connection was lost; what is unacknowledged has to be published again.
+  void holdAfterLoss() HALVOX_EXCLUDES(mutex_);
+  // The handler for the library's options; `publisher` is this object. On a library thread.
+  static void onAcknowledged(jsCtx* context, natsMsg* message, jsPubAck* ack, jsPubAckErr* error,
+                             void* publisher);
+
+ private:
+  enum class Flow : std::uint8_t { kFlowing, kHolding, kProbing };
+  enum class Step : std::uint8_t { kWait, kProbe, kSend };
+
+  Step nextStep(Time now) HALVOX_REQUIRES(mutex_);
+  void publishSome() HALVOX_EXCLUDES(mutex_);
+  void probe() HALVOX_EXCLUDES(mutex_);
+  void provideStreamAgain() HALVOX_EXCLUDES(mutex_);
+  void reclaim() HALVOX_EXCLUDES(mutex_);
+  std::vector<NatsMessage> takeSome() HALVOX_REQUIRES(mutex_);
+  void publish(std::vector<NatsMessage> messages, std::chrono::milliseconds patience)
+      HALVOX_EXCLUDES(mutex_);
+  void hold(std::span<NatsMessage> messages, natsStatus status) HALVOX_EXCLUDES(mutex_);
+  void beginHolding(Time until) HALVOX_REQUIRES(mutex_);
+  void resolve(NatsMessage message, const jsPubAckErr* error) HALVOX_EXCLUDES(mutex_);
+  void settle(const PendingAcks::Entry& entry, const jsPubAckErr* error) HALVOX_EXCLUDES(mutex_);
+  void countFailure(std::uint64_t messages, std::string_view reason) HALVOX_EXCLUDES(mutex_);
+  void abandon(const std::vector<PendingAcks::Entry>& entries, std::string_view reason)
+      HALVOX_EXCLUDES(mutex_);
+  void fail(const std::deque<OutgoingMessage>& messages, std::string_view reason)
+      HALVOX_EXCLUDES(mutex_);
+  [[nodiscard]] std::deque<OutgoingMessage> takeQueue() HALVOX_REQUIRES(mutex_);
+
+  const Configuration::Link& options_;  // the owner's
+  StatisticsService& statistics_;
+  const std::function<void()> wake_;
+  Counter& received_;
+  Counter& acknowledged_;
+  Counter& notAcknowledged_;
+  Counter& publishedAgain_;  // attempts, not messages
+
+  Mutex mutex_;
+  Flow flow_ HALVOX_GUARDED_BY(mutex_) = Flow::kFlowing;
+  Time probeAt_ HALVOX_GUARDED_BY(mutex_){};  // while holding
+  bool isWindowFull_ HALVOX_GUARDED_BY(mutex_) = false;
+  bool isStreamInDoubt_ HALVOX_GUARDED_BY(mutex_) = false;
+  bool isEnding_ HALVOX_GUARDED_BY(mutex_) = false;
+  std::deque<OutgoingMessage> queue_ HALVOX_GUARDED_BY(mutex_);
+  std::size_t queuedBytes_ HALVOX_GUARDED_BY(mutex_) = 0;
+  PendingAcks pending_ HALVOX_GUARDED_BY(mutex_){AckWindow{}};
+  BurstLog failureLog_ HALVOX_GUARDED_BY(mutex_);
+  BurstLog holdLog_ HALVOX_GUARDED_BY(mutex_);
+
+  // Of the link's thread alone.
+  jsCtx* context_ = nullptr;
+  std::chrono::nanoseconds ackTime_ = kAckTime;
+  Time nextStreamCheck_{};
+  BurstLog streamLog_;
+};
+
+// The error that a sender gets for a message that the link does not take.
+[[nodiscard]] Error refusedByLink(std::string description);
+
+}  // namespace halvox::platform::linux_
