@@ -9,6 +9,7 @@
 #include <sys/un.h>
 
 #include "client/WireValue.h"
+#include "platform/linux/base/ErrnoText.h"
 
 namespace halvox::client {
 namespace {
@@ -30,7 +31,7 @@ Failure badRequest(std::string message) {
 }
 
 Failure badRequest(int error) {
-  return badRequest("the request has no form on the wire: " + std::string(strerror(error)));
+  return badRequest("the request has no form on the wire: " + platform::linux_::errnoText(error));
 }
 
 // A non-blocking stream to that socket; the system's error in the second member when there is none.

@@ -2,7 +2,8 @@
 
 #include <cerrno>
 #include <cstdlib>
-#include <cstring>
+
+#include "platform/linux/base/ErrnoText.h"
 
 namespace halvox::client {
 namespace {
@@ -34,12 +35,13 @@ bool meansAbsence(int error) {
 std::string describeTried(std::string_view what, const std::vector<TriedPlace>& tried) {
   std::string text = "no " + std::string(what);
   if (tried.size() == 1) {
-    return text + " at " + tried.front().path + ": " + std::strerror(tried.front().error);
+    return text + " at " + tried.front().path + ": " +
+           platform::linux_::errnoText(tried.front().error);
   }
   text += " found; tried ";
   for (const TriedPlace& place : tried) {
     if (&place != &tried.front()) text += ", then ";
-    text += place.path + " (" + std::strerror(place.error) + ")";
+    text += place.path + " (" + platform::linux_::errnoText(place.error) + ")";
   }
   return text;
 }

@@ -8,6 +8,8 @@
 #include <rapidjson/memorystream.h>
 #include <systemd/sd-bus.h>
 
+#include "platform/linux/base/ErrnoText.h"
+
 namespace halvox::client {
 namespace {
 
@@ -44,7 +46,8 @@ class ValueWriter {
     return false;
   }
   bool isOk(int result) {
-    return result >= 0 || fail("the message cannot hold it: " + std::string(strerror(-result)));
+    return result >= 0 ||
+           fail("the message cannot hold it: " + platform::linux_::errnoText(-result));
   }
   bool open(char type, const char* content) {
     if (++depth_ > kMaxNesting) return fail("nested too deep");

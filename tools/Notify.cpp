@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <cstring>
 #include <filesystem>
 #include <string>
 #include <string_view>
@@ -13,6 +12,7 @@
 #include <fcntl.h>
 #include <sys/stat.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/settings/SettingNames.h"
 #include "tools/ServiceConfiguration.h"
@@ -58,7 +58,8 @@ ExitStatus postNotification(const PostNotification& request, OutputForm form, st
   const UniqueFd descriptor(::open(file.c_str(), kFlags, 0644));
   // A file that was there is touched, so that its time tells of the last post.
   if (!descriptor || ::futimens(descriptor.get(), nullptr) != 0) {
-    return complain(ExitStatus::kCannotWrite, file.native() + ": " + std::strerror(errno));
+    return complain(ExitStatus::kCannotWrite,
+                    file.native() + ": " + platform::linux_::errnoText(errno));
   }
   return ExitStatus::kDone;
 }

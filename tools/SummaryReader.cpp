@@ -5,7 +5,6 @@
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
-#include <cstring>
 #include <fstream>
 #include <memory>
 #include <vector>
@@ -16,6 +15,7 @@
 #include <rapidjson/writer.h>
 #include <sys/stat.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "tools/JsonError.h"
 
 namespace halvox::tools {
@@ -193,7 +193,7 @@ using File = std::unique_ptr<std::FILE, CloseFile>;
 File openFile(const std::string& path, std::string& error) {
   struct stat status {};
   if (::stat(path.c_str(), &status) != 0) {
-    error = std::strerror(errno);
+    error = platform::linux_::errnoText(errno);
     return nullptr;
   }
   if (!S_ISREG(status.st_mode)) {
@@ -201,7 +201,7 @@ File openFile(const std::string& path, std::string& error) {
     return nullptr;
   }
   File file(std::fopen(path.c_str(), "rbe"));
-  if (file == nullptr) error = std::strerror(errno);
+  if (file == nullptr) error = platform::linux_::errnoText(errno);
   return file;
 }
 

@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <cerrno>
 #include <cmath>
-#include <cstring>
 #include <fstream>
 #include <limits>
 
@@ -11,6 +10,8 @@
 #include <rapidjson/istreamwrapper.h>
 #include <rapidjson/ostreamwrapper.h>
 #include <rapidjson/writer.h>
+
+#include "platform/linux/base/ErrnoText.h"
 
 namespace halvox::tools {
 namespace {
@@ -69,7 +70,7 @@ std::variant<TraceResults, std::string> readTraceResults(const std::string& file
   std::ifstream stream(file);
   // A directory opens but cannot be read.
   if (stream) (void)stream.peek();
-  if (stream.bad() || !stream.is_open()) return std::string(std::strerror(errno));
+  if (stream.bad() || !stream.is_open()) return platform::linux_::errnoText(errno);
   rapidjson::IStreamWrapper input(stream);
   rapidjson::Document document;
   constexpr unsigned kFlags = rapidjson::kParseFullPrecisionFlag |

@@ -5,7 +5,6 @@
 #include <cerrno>
 #include <chrono>
 #include <cstdio>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <memory>
@@ -24,6 +23,7 @@
 
 #include "client/HalvoxClient.h"
 #include "client/Vocabulary.h"
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/tracing/PlistPropertyListService.h"
 #include "tools/JsonText.h"
 #include "tools/ServiceConfiguration.h"
@@ -247,7 +247,7 @@ std::string runProgram(std::vector<std::string> command) {
   arguments.push_back(nullptr);
   pid_t pid = 0;
   const int error = ::posix_spawnp(&pid, arguments[0], nullptr, nullptr, arguments.data(), environ);
-  if (error != 0) return "cannot run " + command[0] + ": " + std::strerror(error);
+  if (error != 0) return "cannot run " + command[0] + ": " + platform::linux_::errnoText(error);
   int status = 0;
   while (::waitpid(pid, &status, 0) < 0 && errno == EINTR) {
   }
@@ -327,7 +327,7 @@ ExitStatus exportTrace(const ExportTrace& request, OutputForm form, std::ostream
   if (file) writeTraceEvents(std::get<TraceResults>(read), file);
   file.close();
   if (file) return ExitStatus::kDone;
-  return complain(ExitStatus::kCannotWrite, request.to + ": " + std::strerror(errno));
+  return complain(ExitStatus::kCannotWrite, request.to + ": " + platform::linux_::errnoText(errno));
 }
 
 }  // namespace halvox::tools

@@ -1,11 +1,12 @@
 #include "bench/load/LoadClient.h"
 
 #include <chrono>
-#include <cstring>
 #include <stdexcept>
 #include <thread>
 
 #include <systemd/sd-bus.h>
+
+#include "platform/linux/base/ErrnoText.h"
 
 namespace halvox::bench {
 namespace {
@@ -16,7 +17,8 @@ constexpr std::uint32_t kPlayback = 4;
 constexpr std::uint16_t kState = 18;
 
 void check(int result, const char* what) {
-  if (result < 0) throw std::runtime_error(std::string(what) + ": " + std::strerror(-result));
+  if (result < 0)
+    throw std::runtime_error(std::string(what) + ": " + platform::linux_::errnoText(-result));
 }
 
 struct Unref {

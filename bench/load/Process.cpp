@@ -15,6 +15,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
+
 extern char** environ;
 
 namespace halvox::bench {
@@ -62,7 +64,8 @@ Process::Process(const std::vector<std::string>& command,
   variables.push_back(nullptr);
   const int error = ::posix_spawnp(&pid_, arguments.front().c_str(), nullptr, nullptr,
                                    pointers(arguments).data(), variables.data());
-  if (error != 0) throw std::runtime_error(command.front() + ": " + std::strerror(error));
+  if (error != 0)
+    throw std::runtime_error(command.front() + ": " + platform::linux_::errnoText(error));
 }
 
 Process::~Process() {

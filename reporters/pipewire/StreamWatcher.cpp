@@ -12,6 +12,7 @@
 #include <pipewire/extensions/profiler.h>
 #include <pipewire/pipewire.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/pipewire/Handles.h"
 #include "platform/linux/pipewire/ProfileDecoder.h"
 #include "platform/linux/pipewire/ProfilerBinding.h"
@@ -76,8 +77,8 @@ class StreamWatcher::Impl final : public StreamListener, private pipewire::Serve
         context_(pw_context_new(loop, nullptr, 0)),
         server_(context_.get(), *this) {
     if (context_ == nullptr || retry_ == nullptr) {
-      throw std::runtime_error(fmt::format("cannot set up PipeWire's library: {}",
-                                           std::generic_category().message(errno)));
+      throw std::runtime_error(
+          fmt::format("cannot set up PipeWire's library: {}", platform::linux_::errnoText(errno)));
     }
     if (options_.xruns && !pipewire::loadProfilerModule(context_.get())) {
       options_.xruns = false;
@@ -143,7 +144,7 @@ void StreamWatcher::Impl::connect() {
     return;
   }
   if (!std::exchange(waitingTold_, true)) {
-    options_.log(fmt::format("waiting for PipeWire: {}", std::generic_category().message(errno)));
+    options_.log(fmt::format("waiting for PipeWire: {}", platform::linux_::errnoText(errno)));
   }
   retryAfter(pause_);
   pause_ = std::min(pause_ * 2, kReconnectMax);

@@ -1,8 +1,8 @@
 #include <cerrno>
-#include <cstring>
 #include <fstream>
 #include <memory>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "tools/Complaint.h"
 #include "tools/JsonText.h"
 #include "tools/Script.h"
@@ -29,7 +29,7 @@ ExitStatus runFile(const RunScript& script, const CommonOptions& options,
   if (file.bad() || !file.is_open()) {
     return Complaint("run", options.form(), streams.output, streams.errors)(
         ExitStatus::kBadArguments,
-        "FILE: cannot read " + script.file + ": " + std::strerror(errno));
+        "FILE: cannot read " + script.file + ": " + platform::linux_::errnoText(errno));
   }
   return runScript({file, harmlessText(script.file), false, script.keepGoing}, options,
                    streams.output, streams.errors);

@@ -5,13 +5,13 @@
 #include <cerrno>
 #include <cstdlib>
 #include <limits>
-#include <system_error>
 
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/un.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/base/Utf8.h"
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
@@ -48,7 +48,7 @@ std::string oneLine(std::string_view text) {
 ConfigurationError unreadable(const std::filesystem::path& file, int error) {
   return {ConfigurationError::Kind::kUnreadable,
           oneLine(fmt::format("{}: the configuration cannot be read: {}", file.native(),
-                              std::system_category().message(error)))};
+                              errnoText(error)))};
 }
 
 // The file's text; none when there is no such file.

@@ -2,7 +2,6 @@
 
 #include <cerrno>
 #include <cstring>
-#include <system_error>
 #include <utility>
 
 #include <poll.h>
@@ -10,6 +9,7 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/connection/BusNames.h"
 #include "platform/linux/connection/wire/FrameWriter.h"
 #include "platform/linux/connection/wire/Handshake.h"
@@ -27,8 +27,6 @@ constexpr std::uint32_t kAlreadyOwner = 4;
 constexpr std::string_view kVanishingNames =
     "type='signal',sender='org.freedesktop.DBus',interface='org.freedesktop.DBus',"
     "member='NameOwnerChanged',path='/org/freedesktop/DBus',arg2=''";
-
-std::string systemError(int error) { return std::generic_category().message(error); }
 
 // A connected socket, or an error number.
 std::variant<UniqueFd, int> connectTo(const BusSocket& bus) {
@@ -75,7 +73,7 @@ BusConnector::Failure BusConnector::connectToFirst(const std::string& address) {
       return std::nullopt;
     }
     reasons +=
-        (reasons.empty() ? "" : "; ") + socket.name + ": " + systemError(std::get<int>(result));
+        (reasons.empty() ? "" : "; ") + socket.name + ": " + errnoText(std::get<int>(result));
   }
   return unreachable(reasons.empty() ? "the address names no Unix socket" : reasons);
 }
@@ -169,7 +167,7 @@ BusConnector::Failure BusConnector::send(std::string_view bytes) {
     if (count >= 0) {
       bytes.remove_prefix(static_cast<std::size_t>(count));
     } else if (errno != EAGAIN && errno != EINTR) {
-      return unreachable(systemError(errno));
+      return unreachable(errnoText(errno));
     } else if (!waitFor(POLLOUT)) {
       return unreachable("it does not answer in time");
     }
@@ -184,7 +182,7 @@ BusConnector::Failure BusConnector::receive() {
   const int error = errno;
   input_.received(count > 0 ? static_cast<std::size_t>(count) : 0);
   if (count == 0) return unreachable("it closed the connection");
-  if (count < 0 && error != EAGAIN && error != EINTR) return unreachable(systemError(error));
+  if (count < 0 && error != EAGAIN && error != EINTR) return unreachable(errnoText(error));
   return std::nullopt;
 }
 

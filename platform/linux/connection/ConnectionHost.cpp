@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <system_error>
 #include <utility>
 #include <variant>
 
@@ -11,6 +10,7 @@
 #include <systemd/sd-daemon.h>
 #include <systemd/sd-id128.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/connection/BusConnection.h"
 #include "platform/linux/connection/BusConnector.h"
 #include "platform/linux/connection/ConnectionLog.h"
@@ -47,7 +47,7 @@ void allowMoreDescriptors() {
 
 ConnectionOpenError systemFailure(const std::string& what) {
   return {.kind = ConnectionOpenError::Kind::kSystem,
-          .description = what + ": " + std::generic_category().message(errno)};
+          .description = what + ": " + errnoText(errno)};
 }
 
 }  // namespace

@@ -3,12 +3,12 @@
 #include <cerrno>
 #include <optional>
 #include <string>
-#include <system_error>
 #include <utility>
 
 #include <sys/epoll.h>
 #include <sys/socket.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/connection/ConnectionHost.h"
 #include "platform/linux/connection/ConnectionLimits.h"
 #include "platform/linux/connection/ConnectionLog.h"
@@ -68,7 +68,7 @@ void ListeningSocket::waitForDescriptors(int error) {
   host_.acceptRetries().start(retry_);
   if (std::exchange(isShort_, true)) return;
   host_.statistics().acceptPauses.add();
-  kLog.error("new connections have to wait: ", std::generic_category().message(error));
+  kLog.error("new connections have to wait: ", errnoText(error));
 }
 
 }  // namespace halvox::platform::linux_

@@ -3,7 +3,6 @@
 #include <cerrno>
 #include <cstring>
 #include <string>
-#include <system_error>
 #include <utility>
 
 #include <fcntl.h>
@@ -14,12 +13,12 @@
 #include <systemd/sd-daemon.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
+
 namespace halvox::platform::linux_ {
 namespace {
 
 using Kind = ConnectionOpenError::Kind;
-
-std::string systemError(int error) { return std::generic_category().message(error); }
 
 ConnectionOpenError failure(Kind kind, const std::filesystem::path& path, const std::string& why) {
   return {.kind = kind, .description = "socket " + path.string() + ": " + why};
@@ -47,14 +46,14 @@ std::optional<ConnectionOpenError> clearTheWay(const std::filesystem::path& path
     return failure(Kind::kNotASocket, path, "a file that is no socket is in its place");
   }
   const UniqueFd probe = newSocket();
-  if (!probe) return failure(Kind::kSystem, path, systemError(errno));
+  if (!probe) return failure(Kind::kSystem, path, errnoText(errno));
   const int result =
       connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
   if (result == 0 || errno == EAGAIN || errno == EINPROGRESS) {
     return failure(Kind::kAlreadyServed, path, "another service answers on it");
   }
   if (errno != ECONNREFUSED) {
-    return failure(Kind::kSystem, path, "cannot tell who serves it: " + systemError(errno));
+    return failure(Kind::kSystem, path, "cannot tell who serves it: " + errnoText(errno));
   }
   static_cast<void>(unlink(path.c_str()));
   return std::nullopt;
@@ -69,11 +68,11 @@ ConnectionOpenError bindFailure(const std::filesystem::path& path, int error) {
     case EROFS:
     case EPERM:
       return failure(Kind::kDirectoryNotWritable, path,
-                     "its directory cannot be written: " + systemError(error));
+                     "its directory cannot be written: " + errnoText(error));
     case EADDRINUSE:
       return failure(Kind::kAlreadyServed, path, "another service has just taken it");
     default:
-      return failure(Kind::kSystem, path, systemError(error));
+      return failure(Kind::kSystem, path, errnoText(error));
   }
 }
 
@@ -100,7 +99,7 @@ std::optional<ConnectionOpenError> giveToGroup(const std::filesystem::path& path
   if (const int* error = std::get_if<int>(&looked)) {
     return failure(
         Kind::kSystem, path,
-        "the group " + quoted + " of listener.group cannot be looked up: " + systemError(*error));
+        "the group " + quoted + " of listener.group cannot be looked up: " + errnoText(*error));
   }
   const std::optional<gid_t> id = std::get<std::optional<gid_t>>(looked);
   if (!id.has_value()) {
@@ -114,7 +113,7 @@ std::optional<ConnectionOpenError> giveToGroup(const std::filesystem::path& path
   }
   return failure(errno == EPERM ? Kind::kNotPermitted : Kind::kSystem, path,
                  "cannot give it to the group " + quoted + " of listener.group: " +
-                     systemError(errno) + "; only root and members of a group may");
+                     errnoText(errno) + "; only root and members of a group may");
 }
 
 // The file that bind() makes has the permissions of the descriptor, without those of the umask. It
@@ -132,7 +131,7 @@ std::optional<ConnectionOpenError> letIn(const std::filesystem::path& path,
     if (auto error = giveToGroup(path, access.group)) return error;
   }
   if (chmod(path.c_str(), access.mode) != 0) {
-    return failure(Kind::kSystem, path, "cannot set its permissions: " + systemError(errno));
+    return failure(Kind::kSystem, path, "cannot set its permissions: " + errnoText(errno));
   }
   return std::nullopt;
 }
@@ -181,16 +180,16 @@ std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::p
     return *std::move(error);
   }
   BoundSocket bound{.fd = newSocket(), .file = {}};
-  if (!bound.fd) return failure(Kind::kSystem, path, systemError(errno));
+  if (!bound.fd) return failure(Kind::kSystem, path, errnoText(errno));
   const auto* generic = reinterpret_cast<const sockaddr*>(&*address);
   if (!closeToOthers(bound.fd.get(), access)) {
-    return failure(Kind::kSystem, path, "cannot set its permissions: " + systemError(errno));
+    return failure(Kind::kSystem, path, "cannot set its permissions: " + errnoText(errno));
   }
   if (bind(bound.fd.get(), generic, sizeof *address) != 0) return bindFailure(path, errno);
   bound.file = SocketFile(path);
   if (auto error = letIn(path, access)) return *std::move(error);
   if (listen(bound.fd.get(), SOMAXCONN) != 0) {
-    return failure(Kind::kSystem, path, systemError(errno));
+    return failure(Kind::kSystem, path, errnoText(errno));
   }
   return bound;
 }
@@ -218,7 +217,7 @@ std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
   if (count < 0) {
     return ConnectionOpenError{
         .kind = Kind::kBadActivation,
-        .description = "the passed descriptors cannot be used: " + systemError(-count)};
+        .description = "the passed descriptors cannot be used: " + errnoText(-count)};
   }
   return sockets;
 }

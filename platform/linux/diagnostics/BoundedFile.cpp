@@ -3,24 +3,22 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <system_error>
 
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 
-std::string errorText(int error) { return std::system_category().message(error); }
-
 Finding readBounded(const std::filesystem::path& file, std::size_t most) {
   const UniqueFd descriptor(
       ::open(file.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOFOLLOW | O_NOCTTY));
-  if (!descriptor) return Finding::failed(errorText(errno));
+  if (!descriptor) return Finding::failed(errnoText(errno));
   struct stat status {};
-  if (::fstat(descriptor.get(), &status) != 0) return Finding::failed(errorText(errno));
+  if (::fstat(descriptor.get(), &status) != 0) return Finding::failed(errnoText(errno));
   if (!S_ISREG(status.st_mode)) return Finding::failed("not a regular file");
   Finding finding;
   std::array<char, 16'384> buffer;
@@ -29,7 +27,7 @@ Finding readBounded(const std::filesystem::path& file, std::size_t most) {
     const std::size_t room = std::min(buffer.size(), most + 1 - finding.bytes.size());
     const ssize_t count = ::read(descriptor.get(), buffer.data(), room);
     if (count < 0 && errno == EINTR) continue;
-    if (count < 0 && finding.bytes.empty()) return Finding::failed(errorText(errno));
+    if (count < 0 && finding.bytes.empty()) return Finding::failed(errnoText(errno));
     if (count <= 0) return finding;
     finding.bytes.append(buffer.data(), static_cast<std::size_t>(count));
     if (finding.bytes.size() > most) {

@@ -13,6 +13,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
@@ -148,13 +149,13 @@ std::string endText(int status) {
 Finding runProgram(const std::vector<std::string>& command, std::size_t most,
                    const Deadline& deadline) {
   std::array<int, 2> ends{};
-  if (::pipe2(ends.data(), O_CLOEXEC) != 0) return Finding::failed(errorText(errno));
+  if (::pipe2(ends.data(), O_CLOEXEC) != 0) return Finding::failed(errnoText(errno));
   const UniqueFd reader(ends[0]);
   UniqueFd writer(ends[1]);
   pid_t pid = 0;
   if (const int error = spawn(command, writer.get(), pid); error != 0) {
     return Finding::failed(error == ENOENT ? command.front() + " is not installed"
-                                           : errorText(error));
+                                           : errnoText(error));
   }
   writer.reset();
   Finding finding;

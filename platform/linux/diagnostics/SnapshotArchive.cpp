@@ -10,6 +10,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/diagnostics/BoundedFile.h"
 
@@ -63,7 +64,7 @@ SnapshotArchive::Failure SnapshotArchive::open() {
   ::unlink(path_.c_str());
   writer_->file.reset(
       ::open(path_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, kMode));
-  if (!writer_->file) return path_.native() + ": " + errorText(errno);
+  if (!writer_->file) return path_.native() + ": " + errnoText(errno);
   isCreated_ = true;
   writer_->handle.reset(archive_write_new());
   archive* const out = writer_->handle.get();
@@ -99,7 +100,7 @@ SnapshotArchive::Failure SnapshotArchive::finish() {
   if (Failure failure = writeFailure()) return failure;
   struct stat status {};
   if (::fsync(writer_->file.get()) != 0 || ::fstat(writer_->file.get(), &status) != 0) {
-    return path_.native() + ": " + errorText(errno);
+    return path_.native() + ": " + errnoText(errno);
   }
   size_ = static_cast<std::uint64_t>(status.st_size);
   return std::nullopt;
@@ -107,7 +108,7 @@ SnapshotArchive::Failure SnapshotArchive::finish() {
 
 SnapshotArchive::Failure SnapshotArchive::writeFailure() const {
   if (writer_->error == 0) return std::nullopt;
-  return path_.native() + ": " + errorText(writer_->error);
+  return path_.native() + ": " + errnoText(writer_->error);
 }
 
 SnapshotArchive::Failure SnapshotArchive::failed() const {
@@ -115,7 +116,7 @@ SnapshotArchive::Failure SnapshotArchive::failed() const {
   const int error = archive_errno(writer_->handle.get());
   const char* text = archive_error_string(writer_->handle.get());
   // A positive number is an errno; libarchive's own codes are negative.
-  if (error > 0) return path_.native() + ": " + errorText(error);
+  if (error > 0) return path_.native() + ": " + errnoText(error);
   return path_.native() + ": " + (text == nullptr ? "cannot write the archive" : text);
 }
 

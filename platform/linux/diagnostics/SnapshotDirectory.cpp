@@ -15,6 +15,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/diagnostics/BoundedFile.h"
 
@@ -104,7 +105,7 @@ fs::path SnapshotDirectory::temporaryPath() const { return path_ / kTemporaryNam
 
 std::optional<SnapshotDirectory::Failure> SnapshotDirectory::prepare() const {
   if (::mkdir(path_.c_str(), 0700) == 0 || errno == EEXIST) return std::nullopt;
-  return Failure{path_.native() + ": " + errorText(errno)};
+  return Failure{path_.native() + ": " + errnoText(errno)};
 }
 
 std::variant<fs::path, SnapshotDirectory::Failure> SnapshotDirectory::publish(
@@ -130,7 +131,7 @@ std::variant<fs::path, SnapshotDirectory::Failure> SnapshotDirectory::publish(
     syncDirectory(path_);
     return to;
   }
-  return Failure{path_.native() + ": " + errorText(error)};
+  return Failure{path_.native() + ": " + errnoText(error)};
 }
 
 std::vector<fs::path> SnapshotDirectory::newestFirst() const {

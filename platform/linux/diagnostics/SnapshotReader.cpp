@@ -12,6 +12,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/diagnostics/BoundedFile.h"
 
@@ -52,10 +53,10 @@ class Walk {
     // Opening a pipe would block until somebody writes to it, and libarchive takes an empty name
     // for the standard input.
     struct stat status {};
-    if (::stat(snapshot_.c_str(), &status) != 0) return failed(snapshot_, errorText(errno));
+    if (::stat(snapshot_.c_str(), &status) != 0) return failed(snapshot_, errnoText(errno));
     if (!S_ISREG(status.st_mode)) {
       return failed(snapshot_, S_ISDIR(status.st_mode)
-                                   ? errorText(EISDIR)
+                                   ? errnoText(EISDIR)
                                    : "expected a snapshot, found a special file");
     }
     archive_read_support_format_tar(reader_.get());
@@ -65,7 +66,7 @@ class Walk {
     }
     const int error = archive_errno(reader_.get());
     if (error == kUnknownFormat) return failed(snapshot_, "not a snapshot: unknown file format");
-    return failed(snapshot_, error > 0 ? errorText(error) : textOf(reader_.get()));
+    return failed(snapshot_, error > 0 ? errnoText(error) : textOf(reader_.get()));
   }
 
   // Returns the next entry, null at the end of the archive, or an error.
@@ -175,7 +176,7 @@ Failure unpackEntry(archive* disk, Walk& walk, archive_entry* entry, const fs::p
     // libarchive's text says which step failed; the system's text says why.
     const int error = archive_errno(disk);
     return SnapshotReadError{(directory / name).native() + ": " + textOf(disk) +
-                             (error > 0 ? ": " + errorText(error) : std::string())};
+                             (error > 0 ? ": " + errnoText(error) : std::string())};
   };
   if (archive_write_header(disk, entry) != ARCHIVE_OK) return diskError();
   if (archive_entry_filetype(entry) == AE_IFREG) {
@@ -195,7 +196,7 @@ std::variant<std::vector<std::string>, SnapshotReadError> unpack(const fs::path&
                                                                  const fs::path& directory,
                                                                  ExistingFiles existing) {
   const WorkingDirectory inside(directory);
-  if (inside.error() != 0) return failed(directory, errorText(inside.error()));
+  if (inside.error() != 0) return failed(directory, errnoText(inside.error()));
   if (Failure failure = check(source, directory, existing)) return std::move(*failure);
   const DiskWriter disk(archive_write_disk_new());
   archive_write_disk_set_options(disk.get(), ARCHIVE_EXTRACT_SECURE_SYMLINKS |
@@ -237,9 +238,9 @@ std::variant<std::vector<std::string>, SnapshotReadError> extractSnapshot(const 
   std::error_code error;
   const fs::path source = fs::absolute(snapshot, error);
   if (error) return failed(snapshot, error.message());
-  if (::access(source.c_str(), R_OK) != 0) return failed(snapshot, errorText(errno));
+  if (::access(source.c_str(), R_OK) != 0) return failed(snapshot, errnoText(errno));
   const bool isMade = ::mkdir(directory.c_str(), 0700) == 0;
-  if (!isMade && errno != EEXIST) return failed(directory, errorText(errno));
+  if (!isMade && errno != EEXIST) return failed(directory, errnoText(errno));
   auto unpacked = unpack(source, directory, existing);
   // rmdir() removes the directory only while it is empty, so unpacked files stay.
   if (isMade && unpacked.index() != 0) ::rmdir(directory.c_str());

@@ -2,9 +2,9 @@
 
 #include <string>
 #include <string_view>
-#include <system_error>
 
 #include "platform/connection.h"
+#include "platform/linux/base/ErrnoText.h"
 
 namespace halvox::platform::linux_ {
 
@@ -16,7 +16,7 @@ inline Error fileError(std::string_view what, std::string_view path, int systemE
   text += ' ';
   text += path;
   text += ": ";
-  text += std::generic_category().message(systemError);
+  text += errnoText(systemError);
   return {.domain = "com.tarno.halvox.files", .code = systemError, .description = std::move(text)};
 }
 

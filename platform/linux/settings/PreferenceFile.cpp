@@ -3,12 +3,12 @@
 #include <array>
 #include <cerrno>
 #include <limits>
-#include <system_error>
 
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/base/Utf8.h"
 #include "platform/linux/configuration/TomlNesting.h"
@@ -28,8 +28,7 @@ PreferenceFileError problem(const std::filesystem::path& file, std::string_view 
 }
 
 PreferenceFileError problem(const std::filesystem::path& file, int error) {
-  return problem(file,
-                 ": the preferences cannot be read: " + std::system_category().message(error));
+  return problem(file, ": the preferences cannot be read: " + errnoText(error));
 }
 
 PreferenceFileError tooLarge(const std::filesystem::path& file, std::size_t size) {

@@ -11,6 +11,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/settings/LinkedFiles.h"
 
@@ -21,7 +22,7 @@ namespace {
 constexpr mode_t kModeOfNewFiles = 0644;
 
 PreferenceFileError failure(const std::filesystem::path& path, int error) {
-  return {path.native() + ": " + std::system_category().message(error)};
+  return {path.native() + ": " + errnoText(error)};
 }
 
 // A file under a temporary name beside its target. The destructor deletes it unless it was kept.

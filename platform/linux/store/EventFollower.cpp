@@ -5,12 +5,12 @@
 #include <cerrno>
 #include <cstdint>
 #include <string_view>
-#include <system_error>
 
 #include <sys/epoll.h>
 #include <sys/inotify.h>
 #include <sys/timerfd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/store/StoreSchema.h"
 
 namespace halvox::platform::linux_ {
@@ -27,8 +27,7 @@ constexpr std::uint32_t kWatched =
 StoreError systemFailure(const std::filesystem::path& directory) {
   const auto kind = errno == ENOENT || errno == ENOTDIR ? StoreError::Kind::kMissing
                                                         : StoreError::Kind::kCannotOpen;
-  return {kind, directory.native() +
-                    ": cannot watch the directory: " + std::system_category().message(errno)};
+  return {kind, directory.native() + ": cannot watch the directory: " + errnoText(errno)};
 }
 
 // The -shm file does not count: readers write to it too, and the follower would wake itself.

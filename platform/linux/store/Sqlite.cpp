@@ -1,6 +1,6 @@
 #include "platform/linux/store/Sqlite.h"
 
-#include <system_error>
+#include "platform/linux/base/ErrnoText.h"
 
 namespace halvox::platform::linux_ {
 
@@ -53,7 +53,7 @@ std::optional<std::int64_t> Database::queryInteger(std::string_view sql) {
 std::string Database::errorText() const {
   std::string text = sqlite3_errmsg(handle_.get());
   const int error = systemError();
-  if (error != 0) text += " (" + std::system_category().message(error) + ")";
+  if (error != 0) text += " (" + errnoText(error) + ")";
   return text;
 }
 

@@ -9,6 +9,7 @@
 #include <sys/file.h>
 #include <sys/stat.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/store/StoreSchema.h"
 
 namespace halvox::platform::linux_ {
@@ -23,8 +24,7 @@ constexpr int kMostNamesTried = 100;
 
 StoreError failure(StoreError::Kind kind, const std::filesystem::path& path, std::string_view what,
                    int error) {
-  return {kind,
-          path.native() + ": " + std::string(what) + ": " + std::system_category().message(error)};
+  return {kind, path.native() + ": " + std::string(what) + ": " + errnoText(error)};
 }
 
 std::filesystem::path withSuffix(const std::filesystem::path& path, std::string_view suffix) {

@@ -3,10 +3,10 @@
 #include <cerrno>
 #include <chrono>
 #include <cstdio>
-#include <system_error>
 
 #include <sys/stat.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/store/EventScan.h"
 #include "platform/linux/store/RecordScan.h"
 #include "platform/linux/store/StoreOpening.h"
@@ -42,8 +42,7 @@ std::optional<StoreError> StoreReader::open(const std::filesystem::path& directo
   if (::stat(files_->database().c_str(), &status) != 0) {
     const auto kind = errno == ENOENT || errno == ENOTDIR ? StoreError::Kind::kMissing
                                                           : StoreError::Kind::kCannotOpen;
-    return StoreError{kind,
-                      files_->database().native() + ": " + std::system_category().message(errno)};
+    return StoreError{kind, files_->database().native() + ": " + errnoText(errno)};
   }
   // Opening a pipe would block until somebody writes to it.
   if (!S_ISREG(status.st_mode)) {

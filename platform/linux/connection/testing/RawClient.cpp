@@ -2,7 +2,6 @@
 
 #include <array>
 #include <cerrno>
-#include <cstring>
 #include <stdexcept>
 #include <variant>
 
@@ -10,6 +9,7 @@
 #include <sys/time.h>
 #include <sys/un.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/connection/testing/ServiceUnderTest.h"
 #include "platform/linux/connection/testing/TestInterface.h"
 #include "platform/linux/connection/wire/FrameWriter.h"
@@ -33,7 +33,7 @@ RawClient::RawClient(const std::filesystem::path& socketPath)
   setsockopt(fd_.get(), SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout);
   setsockopt(fd_.get(), SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof timeout);
   if (connect(fd_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0) {
-    throw std::runtime_error(std::string("connect: ") + std::strerror(errno));
+    throw std::runtime_error("connect: " + errnoText(errno));
   }
 }
 
@@ -48,7 +48,7 @@ void RawClient::authenticate(std::string_view withMore) {
 void RawClient::send(std::string_view bytes) {
   while (!bytes.empty()) {
     const ssize_t count = ::send(fd_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
-    if (count < 0) throw std::runtime_error(std::string("send: ") + std::strerror(errno));
+    if (count < 0) throw std::runtime_error("send: " + errnoText(errno));
     bytes.remove_prefix(static_cast<std::size_t>(count));
   }
 }

@@ -5,12 +5,12 @@
 #include <cstdlib>
 #include <string>
 #include <string_view>
-#include <system_error>
 #include <utility>
 
 #include <pipewire/extensions/profiler.h>
 #include <pipewire/impl-module.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/pipewire/ObjectBinding.h"
 #include "platform/linux/pipewire/ProfileDecoder.h"
@@ -27,8 +27,6 @@ constexpr int kRoundTrips = 2;
 // so a few attempts are made after one appeared or went.
 constexpr int kAttempts = 5;
 constexpr auto kPauseBetweenAttempts = std::chrono::milliseconds(200);
-
-std::string messageOf(int error) { return std::generic_category().message(error); }
 
 std::string_view lookUp(const spa_dict* properties, const char* key) {
   const char* value = properties == nullptr ? nullptr : spa_dict_lookup(properties, key);
@@ -101,7 +99,7 @@ GraphFollower::GraphFollower(pw_loop* loop, SharedGraph& graph)
       watch_(loop, [this] { serverAppeared(); }),
       context_(timer_ != nullptr ? makeContext(loop) : nullptr),
       server_(context_.get(), *this) {
-  if (context_ == nullptr) kLog.error("cannot set up PipeWire's library: ", messageOf(errno));
+  if (context_ == nullptr) kLog.error("cannot set up PipeWire's library: ", errnoText(errno));
 }
 
 GraphFollower::~GraphFollower() {
@@ -157,7 +155,7 @@ void GraphFollower::connect() {
     return;
   }
   if (!std::exchange(isMissingTold_, true)) {
-    kLog.info("no PipeWire: ", messageOf(errno), "; it is waited for while sessions run");
+    kLog.info("no PipeWire: ", errnoText(errno), "; it is waited for while sessions run");
   }
   settle();
 }

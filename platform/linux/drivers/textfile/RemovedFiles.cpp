@@ -4,12 +4,12 @@
 #include <cerrno>
 #include <climits>
 #include <cstddef>
-#include <system_error>
 #include <utility>
 
 #include <sys/inotify.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
 
 namespace halvox::platform::linux_ {
@@ -58,8 +58,7 @@ void RemovedFiles::watch() {
   const bool isNoDirectory = errno == ENOENT || errno == ENOTDIR || errno == EACCES;
   if (isNoDirectory || std::exchange(isFailureLogged_, true)) return;
   kLog.error("cannot watch the directory ", directory_.string(), " for deleted files (",
-             std::system_category().message(errno),
-             "); a file that is deleted and written again counts on");
+             errnoText(errno), "); a file that is deleted and written again counts on");
 }
 
 }  // namespace halvox::platform::linux_

@@ -4,13 +4,13 @@
 #include <cerrno>
 #include <chrono>
 #include <functional>
-#include <system_error>
 #include <unordered_set>
 #include <utility>
 
 #include <dirent.h>
 #include <fcntl.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/SmallFile.h"
 
@@ -47,7 +47,7 @@ std::string reasonOf(const SmallFile& file) {
     case SmallFile::Outcome::kFailed:
       break;
   }
-  return std::system_category().message(file.error);
+  return errnoText(file.error);
 }
 
 }  // namespace

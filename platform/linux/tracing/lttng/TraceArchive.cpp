@@ -10,6 +10,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
@@ -23,7 +24,7 @@ constexpr mode_t kArchivePermissions = 0600;
 constexpr mode_t kFilePermissions = 0644;
 
 Failure systemFailure(const std::filesystem::path& path) {
-  return path.string() + ": " + std::generic_category().message(errno);
+  return path.string() + ": " + errnoText(errno);
 }
 
 Failure archiveFailure(archive* to) {

@@ -14,6 +14,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
+
 namespace halvox::platform::linux_ {
 namespace {
 
@@ -70,7 +72,7 @@ std::optional<std::string> TracerKeeper::launch(const Ward& ward, DaemonProcess&
   const std::string failed = "cannot start " + program + ": ";
   auto life = makePipe();
   auto answer = makePipe();
-  if (!life || !answer) return failed + std::generic_category().message(errno);
+  if (!life || !answer) return failed + errnoText(errno);
   ProgramApart keeper{.command = {program, ward.noteFile.string(), ward.ownSessions},
                       .input = life->reading.get(),
                       .output = answer->writing.get(),
@@ -80,7 +82,7 @@ std::optional<std::string> TracerKeeper::launch(const Ward& ward, DaemonProcess&
   }
   if (const int error = startApart(keeper, pid_)) {
     pid_ = 0;
-    return failed + std::generic_category().message(error);
+    return failed + errnoText(error);
   }
   whileWeLive_ = std::move(life->writing);
   answer->writing.reset();

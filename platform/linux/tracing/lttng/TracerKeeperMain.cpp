@@ -25,6 +25,7 @@
 #include <sys/file.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/tracing/lttng/DaemonProcess.h"
 #include "platform/linux/tracing/lttng/TracerSessions.h"
@@ -65,7 +66,7 @@ void awaitEndOfService() {
 std::optional<DaemonProcess> startDaemon(std::string& failure) {
   pid_t pid = 0;
   if (const int error = startApart({.command = {"lttng-sessiond", "--no-kernel"}}, pid)) {
-    failure = "cannot start lttng-sessiond: " + std::generic_category().message(error);
+    failure = "cannot start lttng-sessiond: " + errnoText(error);
     return std::nullopt;
   }
   return DaemonProcess::withNumber(pid);
@@ -89,7 +90,7 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
   // The lock is the keeper's: the daemon and what it starts do not get the descriptor.
   const UniqueFd note(::open(noteFile.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644));
   if (!note || ::flock(note.get(), LOCK_EX) != 0) {
-    say("cannot lock " + noteFile.string() + ": " + std::generic_category().message(errno));
+    say("cannot lock " + noteFile.string() + ": " + errnoText(errno));
     return EXIT_FAILURE;
   }
   std::string failure;
