@@ -4,11 +4,10 @@
 #include <utility>
 #include <vector>
 
-#include <rapidjson/encodings.h>
-#include <rapidjson/memorystream.h>
 #include <systemd/sd-bus.h>
 
 #include "platform/linux/base/ErrnoText.h"
+#include "platform/linux/base/Utf8.h"
 
 namespace halvox::client {
 namespace {
@@ -64,7 +63,8 @@ class ValueWriter {
   }
 
   bool appendText(std::string_view text, const char* subject) {
-    if (!isWireText(text)) return fail(std::string(subject) + " not UTF-8 without NUL");
+    if (!platform::linux_::isUtf8WithoutNul(text))
+      return fail(std::string(subject) + " not UTF-8 without NUL");
     char* room = nullptr;
     if (!isOk(sd_bus_message_append_string_space(message_, text.size(), &room))) return false;
     if (!text.empty()) std::memcpy(room, text.data(), text.size());
@@ -270,18 +270,6 @@ std::optional<Value> readValue(sd_bus_message* message) {
     default:
       return readNumber(message, type);
   }
-}
-
-bool isWireText(std::string_view text) {
-  if (text.find('\0') != std::string_view::npos) return false;
-  struct Nothing {
-    void Put(char) {}
-  } nothing;
-  rapidjson::MemoryStream stream(text.data(), text.size());
-  while (stream.Tell() < text.size()) {
-    if (!rapidjson::UTF8<>::Validate(stream, nothing)) return false;
-  }
-  return stream.Tell() == text.size();
 }
 
 }  // namespace halvox::client

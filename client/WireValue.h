@@ -22,7 +22,4 @@ namespace halvox::client {
 // (file descriptors, other structs, keys that are not strings) or the message is at its end.
 [[nodiscard]] std::optional<Value> readValue(sd_bus_message* message);
 
-// Whether a text can be put on the wire: UTF-8 without a NUL.
-[[nodiscard]] bool isWireText(std::string_view text);
-
 }  // namespace halvox::client

@@ -156,20 +156,5 @@ TEST_F(WireValueTest, NestingPastTheWiresLimitIsRefused) {
   EXPECT_NE(error->find("nested too deep"), std::string::npos);
 }
 
-TEST(WireTextTest, TakesUtf8WithoutNul) {
-  EXPECT_TRUE(isWireText(""));
-  EXPECT_TRUE(isWireText("plain"));
-  EXPECT_TRUE(isWireText("\xC3\xA4\xE2\x82\xAC\xF0\x9F\x8E\xA7"));
-}
-
-TEST(WireTextTest, RefusesWhatIsNoUtf8) {
-  EXPECT_FALSE(isWireText("a\0b"s));
-  EXPECT_FALSE(isWireText("\xC3"));              // cut off
-  EXPECT_FALSE(isWireText("\xC0\x80"));          // longer than need be
-  EXPECT_FALSE(isWireText("\xED\xA0\x80"));      // half of a pair
-  EXPECT_FALSE(isWireText("\xF4\x90\x80\x80"));  // past the last character
-  EXPECT_FALSE(isWireText("\x80"));
-}
-
 }  // namespace
 }  // namespace halvox::client

@@ -13,6 +13,7 @@
 #include "client/HalvoxClient.h"
 #include "client/Vocabulary.h"
 #include "client/WireValue.h"
+#include "platform/linux/base/Utf8.h"
 
 // The handles are plain structs around the C++ objects. No exception may leave this file: all that
 // the calls below can throw is want of memory or threads.
@@ -56,7 +57,7 @@ halvox_result done(Work&& work) noexcept {
 
 // None for texts that may not go into a message.
 std::optional<Value> textValue(const char* text) {
-  if (text == nullptr || !client::isWireText(text)) return std::nullopt;
+  if (text == nullptr || !halvox::platform::linux_::isUtf8WithoutNul(text)) return std::nullopt;
   return Value(text);
 }
 
@@ -66,7 +67,7 @@ std::optional<Value> dataValue(const void* bytes, size_t size) {
 }
 
 halvox_result set(halvox_dictionary* dictionary, const char* key, std::optional<Value> value) {
-  const bool keyIsGood = key != nullptr && client::isWireText(key);
+  const bool keyIsGood = key != nullptr && halvox::platform::linux_::isUtf8WithoutNul(key);
   if (dictionary == nullptr || !keyIsGood || !value) return HALVOX_BAD_ARGUMENT;
   dictionary->dictionary.set(key, std::move(*value));
   return HALVOX_OK;

@@ -4,14 +4,13 @@
 
 #include <rapidjson/error/error.h>
 
+#include "platform/linux/base/Utf8.h"
 #include "tools/JsonText.h"
 
 namespace halvox::tools {
 namespace {
 
 constexpr std::size_t kLongestCharacter = 4;  // bytes of UTF-8
-
-bool continuesCharacter(int byte) { return (byte & 0xC0) == 0x80; }
 
 // What was expected where; none for an error that is not about the next character.
 std::string_view expectationOf(int code) {
@@ -73,7 +72,7 @@ std::string foundIn(std::istream& text) {
   while (character.size() < kLongestCharacter) {
     const int byte = text.peek();
     if (byte == std::istream::traits_type::eof()) break;
-    if (!character.empty() && !continuesCharacter(byte)) break;
+    if (!character.empty() && !platform::linux_::continuesUtf8(static_cast<char>(byte))) break;
     character += static_cast<char>(text.get());
   }
   if (character.empty()) return "the end of the text";
@@ -92,7 +91,7 @@ std::string describeJsonError(std::istream& text, std::size_t offset, int code,
     if (byte == '\n') {
       ++line;
       column = 1;
-    } else if (!continuesCharacter(byte)) {
+    } else if (!platform::linux_::continuesUtf8(static_cast<char>(byte))) {
       ++column;
     }
   }

@@ -4,19 +4,17 @@
 #include <charconv>
 #include <cmath>
 
-#include <rapidjson/encodings.h>
-#include <rapidjson/memorystream.h>
-#include <rapidjson/stringbuffer.h>
+#include "platform/linux/base/Utf8.h"
 
 namespace halvox::pipewire_reporter {
 namespace {
 
-constexpr unsigned kReplacement = 0xFFFD;
+constexpr std::string_view kReplacement = "\uFFFD";
 constexpr float kLoudest = 100;
 constexpr double kVolumeSteps = 1e6;
 
-bool isControl(unsigned codepoint) {
-  return codepoint < 0x20 || (codepoint >= 0x7F && codepoint < 0xA0);
+bool isControl(char32_t character) {
+  return character < 0x20 || (character >= 0x7F && character < 0xA0);
 }
 
 bool isVolume(float volume) { return std::isfinite(volume) && volume >= 0; }
@@ -24,22 +22,15 @@ bool isVolume(float volume) { return std::isfinite(volume) && volume >= 0; }
 }  // namespace
 
 std::string cleanText(std::string_view text) {
-  using Utf8 = rapidjson::UTF8<>;
   constexpr std::size_t kLongestCharacter = 4;
-  rapidjson::StringBuffer result;
-  std::size_t position = 0;
-  while (position < text.size() && result.GetSize() + kLongestCharacter <= kMaxTextBytes) {
-    rapidjson::MemoryStream rest(text.data() + position, text.size() - position);
-    unsigned codepoint = 0;
-    if (Utf8::Decode(rest, &codepoint)) {
-      position += rest.Tell();
-    } else {
-      codepoint = kReplacement;
-      ++position;
-    }
-    Utf8::Encode(result, isControl(codepoint) ? kReplacement : codepoint);
+  std::string result;
+  while (!text.empty() && result.size() + kLongestCharacter <= kMaxTextBytes) {
+    const platform::linux_::Utf8Step step = platform::linux_::nextUtf8(text);
+    const bool isKept = step.valid && !isControl(step.character);
+    result += isKept ? text.substr(0, step.length) : kReplacement;
+    text.remove_prefix(step.length);
   }
-  return {result.GetString(), result.GetSize()};
+  return result;
 }
 
 std::optional<std::int64_t> parseNumber(std::string_view text) {

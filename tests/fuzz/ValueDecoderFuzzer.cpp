@@ -10,9 +10,9 @@
 #include <variant>
 #include <vector>
 
+#include "platform/linux/base/Utf8.h"
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/linux/connection/wire/FrameWriter.h"
-#include "platform/linux/connection/wire/Utf8.h"
 #include "platform/linux/connection/wire/ValueDecoder.h"
 
 namespace halvox::platform::linux_::dbus {
@@ -53,7 +53,7 @@ void checkValues(const Frame& frame, const std::vector<Value>& arguments) {
 }
 
 void checkError(const DecodeError& error) {
-  require(!error.message.empty() && isWireText(error.message));
+  require(!error.message.empty() && isUtf8WithoutNul(error.message));
   require(error.message.find('\n') == std::string::npos);
 }
 

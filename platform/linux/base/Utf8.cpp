@@ -3,33 +3,94 @@
 #include <algorithm>
 #include <array>
 #include <cstdint>
-#include <iterator>
-
-#include <fmt/format.h>
+#include <cstdio>
+#include <cstring>
 
 namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
+constexpr std::size_t kWordSize = sizeof(std::uint64_t);
+// One byte of each is set in every byte of the word.
+constexpr std::uint64_t kEachByte = 0x0101010101010101;
+constexpr std::uint64_t kEachHighBit = 0x8080808080808080;
 
-// The forms of UTF-8: what the first byte looks like and the least character of the form.
-struct Form {
-  unsigned mask;
-  unsigned lead;
-  char32_t least;
+enum class Nul : bool { kAllowed, kRefused };
+
+// True if all eight bytes are ASCII and, if a NUL is refused, none is NUL: subtracting one from a
+// NUL sets its high bit.
+template <Nul kNul>
+bool isPlainWord(const char* bytes) {
+  std::uint64_t word = 0;
+  std::memcpy(&word, bytes, sizeof word);
+  if constexpr (kNul == Nul::kRefused) word |= word - kEachByte;
+  return (word & kEachHighBit) == 0;
+}
+
+template <Nul kNul>
+bool isPlainByte(unsigned char byte) {
+  return byte < 0x80 && (kNul == Nul::kAllowed || byte != 0);
+}
+
+// What may follow a lead byte. The bounds of the second byte exclude overlong forms, surrogates and
+// numbers above U+10FFFF.
+struct Sequence {
+  std::size_t length;
+  unsigned char secondMin;
+  unsigned char secondMax;
 };
-constexpr std::array<Form, 4> kForms{{
-    {0x80, 0x00, 0x0},
-    {0xE0, 0xC0, 0x80},
-    {0xF0, 0xE0, 0x800},
-    {0xF8, 0xF0, 0x10000},
-}};
+
+Sequence sequenceAfter(unsigned char lead) {
+  if (lead >= 0xC2 && lead <= 0xDF) return {2, 0x80, 0xBF};
+  if (lead == 0xE0) return {3, 0xA0, 0xBF};
+  if (lead == 0xED) return {3, 0x80, 0x9F};
+  if (lead >= 0xE1 && lead <= 0xEF) return {3, 0x80, 0xBF};
+  if (lead == 0xF0) return {4, 0x90, 0xBF};
+  if (lead >= 0xF1 && lead <= 0xF3) return {4, 0x80, 0xBF};
+  if (lead == 0xF4) return {4, 0x80, 0x8F};
+  return {0, 0, 0};
+}
+
+// Returns the length of the character of several bytes at the start of `text`; 0 if there is none.
+std::size_t multiByteLength(std::string_view text) {
+  const auto byteAt = [text](std::size_t index) { return static_cast<unsigned char>(text[index]); };
+  const Sequence sequence = sequenceAfter(byteAt(0));
+  if (sequence.length == 0 || sequence.length > text.size()) return 0;
+  if (byteAt(1) < sequence.secondMin || byteAt(1) > sequence.secondMax) return 0;
+  for (std::size_t index = 2; index < sequence.length; ++index) {
+    if (!continuesUtf8(text[index])) return 0;
+  }
+  return sequence.length;
+}
+
+template <Nul kNul>
+bool isValid(std::string_view text) {
+  std::size_t position = 0;
+  while (position < text.size()) {
+    if (text.size() - position >= kWordSize && isPlainWord<kNul>(text.data() + position)) {
+      position += kWordSize;
+    } else if (isPlainByte<kNul>(static_cast<unsigned char>(text[position]))) {
+      ++position;
+    } else {
+      const std::size_t length = multiByteLength(text.substr(position));
+      if (length == 0) return false;
+      position += length;
+    }
+  }
+  return true;
+}
 
 bool isPlain(char character) { return character >= 0x20 && character < 0x7F; }
 
 bool isUnprintable(char32_t character) {
   return character < 0x20 || (character >= 0x7F && character < 0xA0) || character == 0x2028 ||
          character == 0x2029;
+}
+
+std::string hexEscape(const char* format, char32_t number) {
+  std::array<char, 16> text{};
+  std::snprintf(text.data(), text.size(), format, static_cast<unsigned>(number));
+  return text.data();
 }
 
 std::string escaped(char32_t character) {
@@ -43,33 +104,38 @@ std::string escaped(char32_t character) {
     default:
       break;
   }
-  const auto code = static_cast<std::uint32_t>(character);
-  return code < 0x80 ? fmt::format("\\x{:02x}", code) : fmt::format("\\u{:04x}", code);
+  return character < 0x80 ? hexEscape("\\x%02x", character) : hexEscape("\\u%04x", character);
 }
 
 }  // namespace
 
 Utf8Step nextUtf8(std::string_view text) {
   const auto lead = static_cast<unsigned char>(text.front());
-  for (std::size_t length = 1; length <= kForms.size(); ++length) {
-    const Form& form = kForms[length - 1];
-    if ((lead & form.mask) != form.lead) continue;
-    if (text.size() < length) return {};
-    char32_t character = lead & ~form.mask;
-    for (std::size_t index = 1; index < length; ++index) {
-      const auto byte = static_cast<unsigned char>(text[index]);
-      if ((byte & 0xC0U) != 0x80U) return {};
-      character = (character << 6U) | (byte & 0x3FU);
-    }
-    const bool isSurrogate = character >= 0xD800 && character <= 0xDFFF;
-    if (character < form.least || character > 0x10FFFF || isSurrogate) return {};
-    return {length, true, character};
+  if (lead < 0x80) return {.length = 1, .valid = true, .character = lead};
+  const std::size_t length = multiByteLength(text);
+  if (length == 0) return {};
+  // A lead byte has as many set high bits as the character has bytes, and a cleared one below them.
+  char32_t character = lead & (0x7FU >> length);
+  for (std::size_t index = 1; index < length; ++index) {
+    character = (character << 6U) | (static_cast<unsigned char>(text[index]) & 0x3FU);
   }
-  return {};
+  return {.length = length, .valid = true, .character = character};
+}
+
+bool isUtf8(std::string_view text) { return isValid<Nul::kAllowed>(text); }
+
+bool isUtf8WithoutNul(std::string_view text) { return isValid<Nul::kRefused>(text); }
+
+std::string_view utf8Prefix(std::string_view text, std::size_t most) {
+  if (text.size() <= most) return text;
+  std::size_t length = most;
+  while (length > 0 && continuesUtf8(text[length])) --length;
+  return text.substr(0, length);
 }
 
 std::string replaceInvalidUtf8(std::string_view text) {
   std::string result;
+  result.reserve(text.size());
   while (!text.empty()) {
     const Utf8Step step = nextUtf8(text);
     result += step.valid ? text.substr(0, step.length) : kReplacement;
@@ -93,7 +159,7 @@ std::size_t appendEscaped(std::string& line, std::string_view text, std::size_t 
     }
     const Utf8Step step = nextUtf8(rest);
     const std::string part =
-        !step.valid ? fmt::format("\\x{:02x}", static_cast<unsigned char>(rest.front()))
+        !step.valid ? hexEscape("\\x%02x", static_cast<unsigned char>(rest.front()))
         : isUnprintable(step.character) ? escaped(step.character)
                                         : std::string(rest.substr(0, step.length));
     if (part.size() > room) break;

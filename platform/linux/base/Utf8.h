@@ -6,23 +6,47 @@
 
 namespace halvox::platform::linux_ {
 
+// UTF-8 for the outer ring and the client library. Valid UTF-8 has no overlong forms, no surrogates
+// and nothing above U+10FFFF. All functions take any bytes, and any thread may call them.
+//
+// The inner ring cannot include this header. It has its own line of code in
+// session/SummaryFileName.cpp, where text that is already valid is cut between two characters. The
+// fake of the process service has its own replacement of invalid bytes too: the contract suite
+// compares it with what the adapter does by means of this header.
+
 // One step through bytes that should be UTF-8.
 struct Utf8Step {
-  std::size_t length = 1;  // bytes of the character, or 1 for a byte that is no part of one
+  std::size_t length = 1;  // bytes of the character, or 1 for a byte that does not begin one
   bool valid = false;
   char32_t character = 0;  // of a valid step
 };
 
-// The character at the start of `text`, which must not be empty. Overlong forms, surrogates and
-// what lies beyond U+10FFFF are not valid.
-Utf8Step nextUtf8(std::string_view text);
+// Returns the character at the start of `text`, which must not be empty.
+[[nodiscard]] Utf8Step nextUtf8(std::string_view text);
 
-// `text` with each byte that is not UTF-8 replaced by U+FFFD.
-std::string replaceInvalidUtf8(std::string_view text);
+// True for valid UTF-8. Tests ASCII eight bytes at a time.
+[[nodiscard]] bool isUtf8(std::string_view text);
+
+// True for valid UTF-8 without a NUL, which is what D-Bus and C take as a text. This is on the path
+// of every message, so it is one pass: a separate search for the NUL would read the text twice.
+[[nodiscard]] bool isUtf8WithoutNul(std::string_view text);
+
+// True for a byte that continues a character.
+[[nodiscard]] constexpr bool continuesUtf8(char byte) {
+  return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U;
+}
+
+// Returns the longest beginning of `text` that has at most `most` bytes and does not end within a
+// character. If `text` is not valid, invalid bytes near the cut may go too.
+[[nodiscard]] std::string_view utf8Prefix(std::string_view text, std::size_t most);
+
+// Returns `text` with each byte that is not part of valid UTF-8 replaced by U+FFFD.
+[[nodiscard]] std::string replaceInvalidUtf8(std::string_view text);
 
 // Appends `text` so that it stays on one line and cannot drive a terminal: control characters and
 // line separators as escapes (\n, \t, \x1b, \u2028), bytes that are not UTF-8 as \xNN. Stops before
-// the first character that would make more than `room` bytes; returns the bytes of `text` taken.
+// the first character that would make more than `room` bytes. Returns how many bytes of `text` were
+// appended.
 std::size_t appendEscaped(std::string& line, std::string_view text, std::size_t room);
 
 }  // namespace halvox::platform::linux_

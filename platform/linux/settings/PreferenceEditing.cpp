@@ -16,15 +16,6 @@ namespace {
 
 using Edited = std::variant<std::string, PreferenceFileError>;
 
-bool isUtf8(std::string_view text) {
-  while (!text.empty()) {
-    const Utf8Step step = nextUtf8(text);
-    if (!step.valid) return false;
-    text.remove_prefix(step.length);
-  }
-  return true;
-}
-
 // Returns a text as a TOML string on one line.
 std::string quotedText(std::string_view text) {
   std::string quoted = "\"";

@@ -15,13 +15,14 @@
 #include <rapidjson/stringbuffer.h>
 #include <rapidjson/writer.h>
 
+#include "platform/linux/base/Utf8.h"
+
 namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::size_t kKeptBufferBytes = 256 * 1024;
 // The shortest form of a double has at most 24 characters, an integer of 64 bits at most 20.
 constexpr std::size_t kLongestNumber = 32;
-constexpr std::string_view kReplacement = "\xEF\xBF\xBD";  // U+FFFD
 
 // RFC 3339 has four digits for the year. Both in seconds since 1970.
 constexpr double kEarliest = -62135596800.0;  // 0001-01-01
@@ -61,36 +62,6 @@ TextKind classify(std::string_view text) {
   }
   if ((high & kHighs) != 0) return TextKind::kNotAscii;
   return (special & kHighs) != 0 ? TextKind::kEscapesNeeded : TextKind::kPlain;
-}
-
-// Returns the length of the valid UTF-8 sequence at the beginning of `text`, or 0 without one.
-std::size_t sequenceLength(std::string_view text) {
-  const auto byte = [&](std::size_t index) { return static_cast<unsigned char>(text[index]); };
-  const unsigned char first = byte(0);
-  if (first < 0x80U) return 1;
-  const std::size_t length = first >= 0xF0U ? 4 : first >= 0xE0U ? 3 : 2;
-  if (first < 0xC2U || first > 0xF4U || text.size() < length) return 0;
-  for (std::size_t index = 1; index < length; ++index) {
-    if ((byte(index) & 0xC0U) != 0x80U) return 0;
-  }
-  // The second byte reveals overlong forms, surrogates and code points above U+10FFFF.
-  const unsigned char second = byte(1);
-  if (first == 0xE0U && second < 0xA0U) return 0;
-  if (first == 0xEDU && second > 0x9FU) return 0;
-  if (first == 0xF0U && second < 0x90U) return 0;
-  if (first == 0xF4U && second > 0x8FU) return 0;
-  return length;
-}
-
-std::string wellFormed(std::string_view text) {
-  std::string result;
-  result.reserve(text.size());
-  while (!text.empty()) {
-    const std::size_t length = sequenceLength(text);
-    result += length == 0 ? kReplacement : text.substr(0, length);
-    text.remove_prefix(std::max<std::size_t>(length, 1));
-  }
-  return result;
 }
 
 // Writes a date as "2023-11-14T22:13:20.250000Z" into `buffer`.
@@ -235,7 +206,7 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
       case TextKind::kEscapesNeeded:
         return addEscaped(text);
       case TextKind::kNotAscii:
-        return addEscaped(wellFormed(text));
+        return addEscaped(replaceInvalidUtf8(text));
     }
   }
 

@@ -3,23 +3,13 @@
 #include <array>
 #include <cstdio>
 
-#include "platform/linux/connection/wire/Utf8.h"
+#include "platform/linux/base/Utf8.h"
 
 namespace halvox::platform::linux_::dbus {
 namespace {
 
 // Enough to recognise a key by; a path has up to 64 of them.
 constexpr std::size_t kMaxQuotedBytes = 64;
-
-bool isContinuation(char byte) { return (static_cast<unsigned char>(byte) & 0xc0) == 0x80; }
-
-// The start of a text, without half a character at its end.
-std::string_view startOf(std::string_view text) {
-  if (text.size() <= kMaxQuotedBytes) return text;
-  std::size_t length = kMaxQuotedBytes;
-  while (length > 0 && isContinuation(text[length])) --length;
-  return text.substr(0, length);
-}
 
 void appendEscaped(std::string& out, char byte) {
   std::array<char, 5> escaped{};
@@ -31,12 +21,12 @@ void appendEscaped(std::string& out, char byte) {
 }  // namespace
 
 std::string quotable(std::string_view text) {
-  const std::string_view start = startOf(text);
-  const bool isUtf8 = isWireText(start);
+  const std::string_view start = utf8Prefix(text, kMaxQuotedBytes);
+  const bool isText = isUtf8WithoutNul(start);
   std::string out;
   for (const char byte : start) {
     const auto code = static_cast<unsigned char>(byte);
-    if (code < 0x20 || code == 0x7f || (code >= 0x80 && !isUtf8)) {
+    if (code < 0x20 || code == 0x7f || (code >= 0x80 && !isText)) {
       appendEscaped(out, byte);
     } else {
       if (byte == '"' || byte == '\\') out += '\\';

@@ -5,7 +5,6 @@
 #include <gtest/gtest.h>
 
 #include "platform/linux/connection/wire/Signature.h"
-#include "platform/linux/connection/wire/Utf8.h"
 
 namespace halvox::platform::linux_::dbus {
 namespace {
@@ -92,38 +91,6 @@ TEST(SignatureTest, FirstTypeEndsWhereItIsComplete) {
   EXPECT_EQ(firstTypeLength("(d)y"), 3U);
   EXPECT_EQ(firstTypeLength("a(y(ss)a{s(d)})u"), 15U);
   EXPECT_EQ(firstTypeLength("uu"), 1U);
-}
-
-TEST(Utf8Test, WellFormedTextIsTaken) {
-  for (const char* good : {"", "a", "eight by", "exactly 16 bytes", "\x7f", "\xc2\x80", "\xdf\xbf",
-                           "\xe0\xa0\x80", "\xed\x9f\xbf", "\xee\x80\x80", "\xef\xbf\xbf",
-                           "\xf0\x90\x80\x80", "\xf4\x8f\xbf\xbf", "1234567\xc3\xa4 more of it"}) {
-    EXPECT_TRUE(isWireText(good)) << good;
-  }
-}
-
-TEST(Utf8Test, IllFormedTextIsRefusedWhereverItStands) {
-  for (const char* bad :
-       {"\x80", "\xbf", "\xc0\x80", "\xc1\xbf", "\xc2", "\xc2\x41", "\xe0\x9f\xbf", "\xe1\x80",
-        "\xe1\x80\x41", "\xed\xa0\x80", "\xf0\x8f\xbf\xbf", "\xf1\x80\x80", "\xf4\x90\x80\x80",
-        "\xf5\x80\x80\x80", "\xff"}) {
-    for (std::size_t before = 0; before < 17; ++before) {
-      const std::string text = std::string(before, 'x') + bad;
-      EXPECT_FALSE(isWireText(text)) << text;
-      EXPECT_FALSE(isWireText(text + "12345678")) << text;
-    }
-  }
-}
-
-TEST(Utf8Test, NulIsRefusedWhereverItStands) {
-  for (std::size_t length = 1; length < 20; ++length) {
-    for (std::size_t at = 0; at < length; ++at) {
-      std::string text(length, '\x01');
-      EXPECT_TRUE(isWireText(text));
-      text[at] = '\0';
-      EXPECT_FALSE(isWireText(text)) << length << " " << at;
-    }
-  }
 }
 
 }  // namespace

@@ -4,11 +4,11 @@
 #include <cstdint>
 #include <limits>
 
+#include "platform/linux/base/Utf8.h"
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/linux/connection/wire/HeaderFields.h"
 #include "platform/linux/connection/wire/Names.h"
 #include "platform/linux/connection/wire/Signature.h"
-#include "platform/linux/connection/wire/Utf8.h"
 
 namespace halvox::platform::linux_::dbus {
 namespace {
@@ -178,7 +178,7 @@ bool ValueEncoder::appendStringAs(char code, const Value& value) {
     return true;
   }
   if (text.size() > kMaxMessageBytes) return false;
-  if (!(code == 'o' ? isObjectPath(text) : isWireText(text))) return false;
+  if (!(code == 'o' ? isObjectPath(text) : isUtf8WithoutNul(text))) return false;
   appendText(text);
   return true;
 }
@@ -233,7 +233,7 @@ bool ValueEncoder::appendDictionary(std::string_view type, const Dictionary& dic
   std::size_t lengthPosition = 0;
   const std::size_t first = beginArray(8, lengthPosition);
   for (const auto& [key, value] : dictionary) {
-    if (!isWireText(key.text())) return false;
+    if (!isUtf8WithoutNul(key.text())) return false;
     align(8);
     appendText(key.text());
     if (!append(valueType, value, entryLevel)) return false;

@@ -6,7 +6,7 @@
 #include <span>
 #include <string_view>
 
-#include "platform/linux/connection/wire/Utf8.h"
+#include "platform/linux/base/Utf8.h"
 
 namespace halvox::platform::linux_::dbus {
 
@@ -59,7 +59,7 @@ class WireReader {
   bool readBoolean(bool& boolean);
   bool readText(std::string_view& text) {
     if (!readUncheckedText(text)) return false;
-    return isWireText(text) || fail("text that is not UTF-8 or has a NUL in it");
+    return isUtf8WithoutNul(text) || fail("text that is not UTF-8 or has a NUL in it");
   }
   // A text whose characters the caller checks by a stricter rule.
   bool readUncheckedText(std::string_view& text) {

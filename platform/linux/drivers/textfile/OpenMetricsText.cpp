@@ -183,11 +183,7 @@ class Parser {
 
   static void checkLine(std::string_view line) {
     if (line.size() > OpenMetricsText::kLongestLine) throw Mistake{"the line is too long"};
-    while (!line.empty()) {
-      const Utf8Step step = nextUtf8(line);
-      if (!step.valid) throw Mistake{"expected UTF-8"};
-      line.remove_prefix(step.length);
-    }
+    if (!isUtf8(line)) throw Mistake{"expected UTF-8"};
   }
 
   void parseLine(std::string_view text) {

@@ -3,6 +3,8 @@
 #include <string>
 #include <utility>
 
+#include "platform/linux/base/Utf8.h"
+
 namespace halvox::platform::linux_ {
 namespace {
 
@@ -11,19 +13,14 @@ constexpr const char* kErrorDomain = "com.tarno.halvox.link";
 constexpr std::int64_t kStoreClosed = 1;
 constexpr std::size_t kLongestName = 255;
 
-bool continuesCharacter(char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U; }
-
 // A client's configuration can put any value in the place of a name. Names are stored with every
 // message, so what is too long for a name is cut off between characters: else small messages could
 // fill the store and keep it busy.
 std::string nameOf(const Dictionary& info, std::string_view key) {
   const Value* const value = info.find(key);
   if (value == nullptr) return {};
-  std::string name = value->isString() ? std::string(value->string()) : describe(*value);
-  if (name.size() <= kLongestName) return name;
-  std::size_t length = kLongestName;
-  while (length > 0 && continuesCharacter(name[length])) --length;
-  return name.substr(0, length);
+  const std::string name = value->isString() ? std::string(value->string()) : describe(*value);
+  return std::string(utf8Prefix(name, kLongestName));
 }
 
 std::shared_ptr<const LinkParty> partyOf(const Dictionary& sessionInfo,

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "platform/linux/base/Utf8.h"
+
 namespace halvox::platform::linux_ {
 namespace {
 
@@ -12,17 +14,11 @@ bool isAllowed(char character) {
   return byte > ' ' && byte != 0x7FU && character != '.' && character != '*' && character != '>';
 }
 
-bool continuesCharacter(char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U; }
-
 }  // namespace
 
 std::string subjectToken(std::string_view text) {
   if (text.empty()) return std::string(1, kReplacement);
-  std::size_t length = std::min(text.size(), kLongestSubjectToken);
-  if (length < text.size()) {
-    while (length > 0 && continuesCharacter(text[length])) --length;
-  }
-  std::string token(text.substr(0, length));
+  std::string token(utf8Prefix(text, kLongestSubjectToken));
   std::ranges::replace_if(
       token, [](char character) { return !isAllowed(character); }, kReplacement);
   return token.empty() ? std::string(1, kReplacement) : token;
