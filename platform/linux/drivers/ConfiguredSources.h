@@ -8,7 +8,8 @@
 
 namespace halvox::platform::linux_ {
 
-// The sources of driver counters that the configuration wants and this build has.
+// Makes the sources of driver counters that the configuration enables and this build contains. The
+// caller owns them. Nothing is read yet.
 [[nodiscard]] std::vector<std::unique_ptr<DriverSource>> makeDriverSources(
     const Configuration::Drivers& drivers);
 

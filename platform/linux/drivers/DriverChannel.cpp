@@ -23,6 +23,7 @@ std::size_t ChannelDescription::valueCount() const {
 std::string ChannelDescription::fullName() const {
   std::string name = std::to_string(static_cast<int>(format));
   for (const auto* part : {&driverName, &group, &subGroup, &channelName}) {
+    // The length keeps two channels apart whose names contain each other's separators.
     name += part->has_value() ? '\n' + std::to_string((*part)->size()) + ':' + **part : "\n-";
   }
   return name;

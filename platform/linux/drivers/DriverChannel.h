@@ -10,7 +10,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The bounds of one bucket: values from `lower` on and below `upper`.
+// The bounds of one bucket: values of at least `lower` and less than `upper`.
 struct BucketBounds {
   std::int64_t lower;
   std::int64_t upper;
@@ -18,12 +18,11 @@ struct BucketBounds {
 };
 
 // What does not change about a channel. Its address is the channel's identity: a source makes one
-// description for each of its channels and gives the same one as long as the channel is there.
-// Immutable; shared by the source and all readings.
+// description for each of its channels, and uses the same one as long as the channel exists.
+// Comparing addresses makes a report cheap. Immutable; shared by the source and all readings.
 struct ChannelDescription {
   IOReportFormat format = IOReportFormat::kSimple;
-  // Of a simple channel. What says nothing else is a gauge, of which a fall is never taken for a
-  // reset.
+  // Of a simple channel. A gauge is the default: a fall of a gauge is never taken for a reset.
   IOReportKind kind = IOReportKind::kGauge;
   std::optional<std::string> driverName{};
   std::optional<std::string> group{};
@@ -33,16 +32,16 @@ struct ChannelDescription {
   std::vector<std::string> states{};    // of a state channel
   std::vector<BucketBounds> buckets{};  // of a histogram channel
 
-  // How many numbers a channel's value is: one of a simple channel; transitions and residency of
-  // each state; the hits of each bucket.
+  // How many numbers the channel's value has: one for a simple channel, transitions and residency
+  // for each state, hits for each bucket.
   [[nodiscard]] std::size_t valueCount() const;
-  // The format and the four names in one text, which no two channels of a report share.
+  // The format and the four names as one text. No two channels of a reading have the same text.
   [[nodiscard]] std::string fullName() const;
   friend bool operator==(const ChannelDescription&, const ChannelDescription&) = default;
 };
 
-// The channels of one source, in its order, and where the values of each begin in a reading.
-// Immutable; shared by readings, so that a reading costs no more than its numbers.
+// The channels of one source in order, and where the values of each begin in a reading. Immutable;
+// shared by readings, so that a reading costs no more than its numbers.
 class ChannelList {
  public:
   using Channel = std::shared_ptr<const ChannelDescription>;
@@ -52,7 +51,7 @@ class ChannelList {
   [[nodiscard]] std::size_t size() const { return channels_.size(); }
   [[nodiscard]] const Channel& operator[](std::size_t index) const { return channels_[index]; }
   [[nodiscard]] std::size_t offset(std::size_t index) const { return offsets_[index]; }
-  // Of all channels together.
+  // The number of values of all channels.
   [[nodiscard]] std::size_t valueCount() const { return valueCount_; }
 
  private:
@@ -61,11 +60,12 @@ class ChannelList {
   std::size_t valueCount_ = 0;
 };
 
-// What one source counted up to one moment. Signed numbers are kept as their two's complement.
+// What one source has counted up to one moment. Signed numbers are kept as their two's complement.
+// Immutable after its source has made it; sessions share it from their start to their stop.
 struct Reading {
   std::shared_ptr<const ChannelList> channels;
   std::vector<std::uint64_t> values;
-  // Tells the source that somebody still holds its readings; may be null.
+  // Tells the source that someone still holds one of its readings. May be null.
   std::shared_ptr<void> lease{};
 };
 

@@ -35,7 +35,7 @@ std::vector<IOReportState> statesOf(const ChannelDescription& channel, Numbers v
         {.name = channel.states[index],
          .inTransitions = values[2 * index],
          .residency = residency,
-         // The part of the time that the state held.
+         // The state's share of the time.
          .dutyCycle =
              total == 0 ? 0 : static_cast<double>(residency) / static_cast<double>(total)});
   }
@@ -57,8 +57,8 @@ struct Extremes {
   std::int64_t maximum = 0;
 };
 
-// The bounds of the lowest and of the highest bucket with hits. What is in an open bucket is known
-// to be no lower than where it begins, and nothing more.
+// The bounds of the lowest and of the highest bucket with hits. Values in an open bucket are at
+// least its lower bound; nothing more is known about them.
 Extremes extremesOf(std::span<const IOReportBucket> buckets) {
   Extremes extremes;
   bool isFirst = true;
@@ -95,7 +95,7 @@ int show(const ChannelDescription& channel, Numbers values,
   return visitor(shown);
 }
 
-// Where the values of each channel are.
+// The values of each channel. By address, which is a channel's identity.
 using ValuesByChannel = std::unordered_map<const ChannelDescription*, Numbers>;
 
 ValuesByChannel index(const DriverSamples& samples) {
@@ -108,7 +108,7 @@ ValuesByChannel index(const DriverSamples& samples) {
   return values;
 }
 
-// At most what 64 bits hold: a difference that wrapped would turn a fall into a rise.
+// Limited to what 64 bits hold: a difference that wrapped around would turn a fall into a rise.
 std::uint64_t gaugeDifference(std::uint64_t previous, std::uint64_t current) {
   std::int64_t difference = 0;
   if (__builtin_sub_overflow(asSigned(current), asSigned(previous), &difference)) {
@@ -124,7 +124,7 @@ void appendDifference(const ChannelDescription& channel, Numbers previous, Numbe
     differences.push_back(gaugeDifference(previous[0], current[0]));
     return;
   }
-  // The numbers of a channel belong together: one that was reset was reset as a whole.
+  // The numbers of a channel belong together: if one was reset, all of them were.
   bool isReset = false;
   for (std::size_t number = 0; number < current.size(); ++number) {
     isReset |= current[number] < previous[number];

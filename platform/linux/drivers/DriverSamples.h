@@ -8,12 +8,13 @@
 
 namespace halvox::platform::linux_ {
 
-// Which of a reading's channels are meant, by their positions in its list.
+// The channels of a reading that are meant, as positions in its list.
 using ChannelSelection = std::vector<std::uint32_t>;
 
-// The channels of one subscription at one moment, or their change between two. Holds the readings
-// of all sources whole and shares them with the other subscriptions that were sampled at that
-// moment, so samples cost next to nothing of their own. Immutable.
+// The channels of one subscription at one moment, or their change between two moments. Immutable.
+//
+// Holds the readings of all sources, which it shares with the other subscriptions of that moment.
+// The samples of eight groups therefore cost hardly more memory than one reading.
 class DriverSamples final : public IOReportSamples {
  public:
   struct Part {
@@ -30,9 +31,9 @@ class DriverSamples final : public IOReportSamples {
   const std::vector<Part> parts_;
 };
 
-// What changed from one to the other, of the channels that are in both: what a channel counted
-// before it was first sampled is not known, nor is what a source counted that was late. The
-// differences are those that IOReportCreateSamplesDelta promises.
+// The change from one to the other, of the channels that are in both. A channel that is only in one
+// has no known start, and a source that was late has none either. The differences are those that
+// IOReportCreateSamplesDelta promises.
 [[nodiscard]] std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
                                                              const DriverSamples& current);
 

@@ -66,7 +66,7 @@ TEST(DriverSamplesTest, NegativeValuesAreSubtractedWithTheirSign) {
               ElementsAre("-/Tx/-/gain  = 7"));
 }
 
-// The same names do not make the same channel: a card that was replugged is a new one.
+// Equal names do not make the same channel: a card that was plugged in again is a new one.
 TEST(DriverSamplesTest, IdentityIsTheChannelNotItsName) {
   const auto first = simpleChannel("Tx", "frames");
   const auto second = simpleChannel("Tx", "frames");
@@ -114,7 +114,7 @@ TEST(DriverSamplesTest, HitsAreSubtractedAndTheExtremesAreThoseOfTheBucketsThatG
               ElementsAre("-/-/-/-  = 0-10:0 10-20:2 min 10 max 20"));
 }
 
-// A histogram's numbers belong together: one that began anew did so as a whole.
+// The numbers of a histogram belong together: if one was reset, all of them were.
 TEST(DriverSamplesTest, AHistogramWithOneBucketBackwardsCountsFromZeroAsAWhole) {
   const auto channel = histogramChannel({{0, 10}, {10, 20}});
 

@@ -7,8 +7,11 @@
 
 namespace halvox::platform::linux_ {
 
-// One place that driver counters come from. The registry owns it and calls it on one thread that is
-// the source's own, so a source that waits delays no other.
+// One place that driver counters come from.
+//
+// Its SourceReader owns it and calls it on one thread, which is the source's own: a source that
+// waits, for a disk or a driver, then delays no other source. A failure makes a reading smaller;
+// the source logs it.
 class DriverSource {
  public:
   DriverSource() = default;
@@ -16,13 +19,13 @@ class DriverSource {
   DriverSource& operator=(const DriverSource&) = delete;
   virtual ~DriverSource() = default;
 
-  // For log lines and counters: "alsa".
+  // Names the source in log lines and counters, such as "alsa".
   [[nodiscard]] virtual std::string_view name() const = 0;
-  // The first reading, which decides whether there is anything to subscribe to, may wait this long
-  // for a server to answer. Called once, before any reading.
+  // Prepares the source. May wait for a server to answer: the first reading decides what can be
+  // subscribed to. Called once, before any reading.
   virtual void open() {}
-  // All channels that there are now and their values. Never null; empty when there is nothing. What
-  // cannot be read is left out and logged by the source.
+  // All channels that exist now, and their values. Never null; empty if there are none. What cannot
+  // be read is skipped and logged by the source.
   [[nodiscard]] virtual std::shared_ptr<const Reading> read() = 0;
 };
 

@@ -5,14 +5,14 @@
 
 namespace halvox::platform::linux_ {
 
-// Where a program without installed services wants the lines of this folder. Set before any source
-// is made; the category outlives them.
+// The category for a program that has not installed the services, such as halvoxctl. Set it before
+// any source is made; it must outlive them.
 inline LogCategory*& ownDriversCategory() {
   static LogCategory* category = nullptr;
   return category;
 }
 
-// The log category of everything in this folder.
+// The log category of everything in this folder. Any thread may call.
 inline LogCategory& driversCategory() {
   static LogCategory& category = ownDriversCategory() != nullptr
                                      ? *ownDriversCategory()

@@ -1,4 +1,4 @@
-// The contract of the drivers' counters, kept by the adapter with a source that a test makes.
+// The contract of driver counters, run on the adapter with a source that a test makes.
 
 #include <chrono>
 #include <memory>
@@ -49,7 +49,7 @@ class LinuxIOReportHarness {
   LinuxIOReportHarness() {
     std::vector<std::unique_ptr<DriverSource>> sources;
     sources.push_back(std::make_unique<testing::MadeSource>([this] { return read(); }));
-    // As long as no busy machine makes a reading late.
+    // Long enough that no reading is late on a busy machine.
     service_ = std::make_unique<LinuxIOReportService>(std::move(sources), platform_.statistics,
                                                       std::chrono::seconds(10));
     service_->open();
@@ -74,7 +74,7 @@ class LinuxIOReportHarness {
   FakePlatform platform_;
   std::mutex mutex_;
   FakeIOReportService::ChannelList channels_;
-  ReadingMaker readings_;  // of the source's thread
+  ReadingMaker readings_;  // used by the source's thread
   std::unique_ptr<LinuxIOReportService> service_;
 };
 

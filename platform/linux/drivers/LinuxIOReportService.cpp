@@ -15,7 +15,8 @@ namespace {
 using Readers = std::vector<std::unique_ptr<SourceReader>>;
 using Readings = std::vector<std::shared_ptr<const Reading>>;  // by source; null: late
 
-// Reads all sources at once.
+// Asks all sources first and takes the readings afterwards, so that the wait is that of the slowest
+// source and not the sum.
 Readings read(const Readers& readers, std::chrono::milliseconds longestWait) {
   std::vector<SourceReader::Asked> asked;
   asked.reserve(readers.size());
@@ -38,9 +39,9 @@ struct GroupName {
   }
 };
 
-// The channels of a group that there were when it was looked for, by their full names. Immutable
-// but for where they are in the sources' readings, which is found anew when a source's channels
-// change.
+// The channels of a group that existed when the set was made, identified by their full names.
+// Immutable except for the positions in the sources' readings, which are computed again when the
+// channels of a source change. Shared by the samples' users; any thread may call.
 class GroupChannels final : public IOReportChannels {
  public:
   GroupChannels(GroupName group, const Readings& readings)
@@ -56,7 +57,7 @@ class GroupChannels final : public IOReportChannels {
 
   [[nodiscard]] std::int32_t count() const { return static_cast<std::int32_t>(names_.size()); }
 
-  // The part of a source's reading that is in the set.
+  // The part of a source's reading that belongs to the set.
   [[nodiscard]] DriverSamples::Part select(std::size_t source,
                                            std::shared_ptr<const Reading> reading) const {
     const MutexLock lock(mutex_);
@@ -77,7 +78,7 @@ class GroupChannels final : public IOReportChannels {
     auto selection = std::make_shared<ChannelSelection>();
     for (std::uint32_t position = 0; position < channels.size(); ++position) {
       const ChannelDescription& channel = *channels[position];
-      // The group first: it needs no text to be made.
+      // The group first: comparing it allocates no text.
       if (group_.has(channel) && names_.contains(channel.fullName())) {
         selection->push_back(position);
       }
@@ -91,9 +92,11 @@ class GroupChannels final : public IOReportChannels {
   mutable std::vector<Found> found_ HALVOX_GUARDED_BY(mutex_);  // by source
 };
 
+// Nothing to keep: the set of channels says everything. The port asks for the object.
 class GroupSubscription final : public IOReportSubscription {};
 
-// Reads when it is first asked.
+// Reads the sources when it is asked for the first time, so that a moment without samples costs
+// nothing.
 class ReadMoment final : public IOReportMoment {
  public:
   ReadMoment(const Readers& readers, std::chrono::milliseconds longestWait)
@@ -105,7 +108,7 @@ class ReadMoment final : public IOReportMoment {
   }
 
  private:
-  const Readers& readers_;  // of the service
+  const Readers& readers_;  // owned by the service
   const std::chrono::milliseconds longestWait_;
   std::optional<Readings> readings_;
 };
@@ -134,7 +137,8 @@ void LinuxIOReportService::open() {
 
 IOReportService::Channels LinuxIOReportService::IOReportCopyChannelsInGroup(
     Name group, Name subGroup, std::optional<IOReportError>& /*error*/) {
-  // What is missed here is missed for good, so it may take longer than a moment's samples.
+  // A channel that is missed here is missed until the service restarts, so this may take longer
+  // than the samples of a moment.
   const Readings readings = read(readers_, std::max(longestWait_, SourceReader::kLongestOpening));
   GroupName names{std::optional<std::string>(group), std::optional<std::string>(subGroup)};
   return std::make_shared<GroupChannels>(std::move(names), readings);

@@ -11,15 +11,17 @@
 
 namespace halvox::platform::linux_ {
 
-// What the kernel, the sound server and other daemons count, as driver channels. A set of channels
-// is of those that there are when it is asked for; a subscription never gets more. A channel that
-// goes and comes again is sampled again, known by its names and its format. A source that takes
-// longer than `SourceReader::kLongestOpening` to open is in no set that is asked for before it is
-// open.
+// Reports what the kernel, the sound server and other daemons count as driver channels.
 //
-// No moment holds the caller longer than the longest wait, all sources together; what is late is
-// left out of its samples. Looking for channels, which is done at the start only, may take as long
-// as the opening. Any thread may call. Owns the sources and their threads, which sleep while nobody
+// A set of channels has those that exist when it is asked for, and a subscription never gets more.
+// A channel that disappears and appears again is sampled again; its names and its format identify
+// it. A source that takes longer than `SourceReader::kLongestOpening` to open is in no set that is
+// asked for before it has opened.
+//
+// Threads: any may call. A sample blocks for at most the longest wait, for all sources together; a
+// source that is late is skipped. Looking for channels, which the service does only when it starts,
+// may take as long as the opening.
+// Owner: the platform. It owns the sources and their threads, which sleep while nobody asks.
 // asks.
 class LinuxIOReportService final : public IOReportService {
  public:
@@ -28,8 +30,9 @@ class LinuxIOReportService final : public IOReportService {
                        std::chrono::milliseconds longestWait = SourceReader::kLongestWait);
   ~LinuxIOReportService() override;
 
-  // Starts the threads, which open all sources at once, and waits until each has, or has taken too
-  // long. Once, before all else, when the services are installed.
+  // Starts the threads, which open all sources at once, and waits until each has opened or has
+  // taken too long. Call it once, before everything else, after the services are installed: sources
+  // log.
   void open();
 
   Channels IOReportCopyChannelsInGroup(Name group, Name subGroup,
@@ -38,7 +41,7 @@ class LinuxIOReportService final : public IOReportService {
   Subscription IOReportCreateSubscription(const Channels& channels, Channels& subscribedChannels,
                                           std::optional<IOReportError>& error) override;
   [[nodiscard]] Moment makeMoment() override;
-  // The moment must be one of this service.
+  // The moment must come from this service.
   Samples IOReportCreateSamples(const Subscription& subscription, const Channels& channels,
                                 IOReportMoment& moment,
                                 std::optional<IOReportError>& error) override;

@@ -31,6 +31,7 @@ void ReadingMaker::add(Channel channel, std::span<const std::uint64_t> values) {
 }
 
 std::shared_ptr<const Reading> ReadingMaker::finish(std::shared_ptr<void> lease) {
+  // Sharing the list lets a set of channels keep the positions that it has computed.
   if (list_ == nullptr || !isListOf(*list_, channels_)) {
     list_ = std::make_shared<const ChannelList>(channels_);
   }

@@ -10,20 +10,21 @@
 
 namespace halvox::platform::linux_ {
 
-// Puts a source's readings together and keeps the identity of its channels from one reading to the
-// next: the same name and the same description give the same channel, and as long as the channels
-// are the same, readings share their list. A channel that is not in a reading is forgotten.
-// Belongs to the source's thread.
+// Puts the readings of a source together and keeps the identity of its channels: if name and
+// description are the same as in the reading before, the channel is the same. While all channels
+// are the same, readings share one list. A channel that is missing from a reading is forgotten.
+//
+// Belongs to the source's thread; the source owns it.
 class ReadingMaker {
  public:
   using Channel = ChannelList::Channel;
 
-  // Adds a channel that the source knows under that name.
+  // Adds a channel that the source identifies by this name.
   void add(const std::string& name, ChannelDescription description,
            std::span<const std::uint64_t> values);
   // Adds a channel whose identity the source keeps itself.
   void add(Channel channel, std::span<const std::uint64_t> values);
-  // The reading of all that was added since the last one; it holds the lease. Never null.
+  // A reading of everything that was added since the last one. It holds the lease. Never null.
   [[nodiscard]] std::shared_ptr<const Reading> finish(std::shared_ptr<void> lease = nullptr);
 
  private:
@@ -31,7 +32,7 @@ class ReadingMaker {
   std::map<std::string, Channel> added_;
   std::vector<Channel> channels_;
   std::vector<std::uint64_t> values_;
-  std::shared_ptr<const ChannelList> list_;  // of the last reading
+  std::shared_ptr<const ChannelList> list_;  // of the latest reading
 };
 
 }  // namespace halvox::platform::linux_

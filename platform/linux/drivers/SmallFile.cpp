@@ -12,6 +12,7 @@ namespace {
 constexpr std::size_t kPieceSize = 16'384;
 
 SmallFile failure(int error) {
+  // ENODEV: a file of the kernel whose device has been removed.
   const bool isMissing = error == ENOENT || error == ENOTDIR || error == ENODEV;
   return {isMissing ? SmallFile::Outcome::kMissing : SmallFile::Outcome::kFailed, error};
 }
@@ -20,14 +21,14 @@ SmallFile failure(int error) {
 
 SmallFile readSmallFile(int directory, const char* name, std::size_t most) {
   struct stat status {};
-  // Looked at before it is opened, because opening a device may do something.
+  // Checked before it is opened, because opening a device can have an effect.
   if (::fstatat(directory, name, &status, 0) != 0) return failure(errno);
   if (!S_ISREG(status.st_mode)) return {SmallFile::Outcome::kNotRegular};
   if (std::cmp_greater(status.st_size, most)) return {SmallFile::Outcome::kTooLarge};
 
   const UniqueFd file(::openat(directory, name, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
   if (!file) return failure(errno);
-  // What is there now may be something else than what was looked at.
+  // Checked again, because another file may have taken its place meanwhile.
   if (::fstat(file.get(), &status) != 0) return failure(errno);
   if (!S_ISREG(status.st_mode)) return {SmallFile::Outcome::kNotRegular};
   SmallFile result{SmallFile::Outcome::kRead};

@@ -18,12 +18,12 @@ struct SmallFile {
   std::string text{};
 };
 
-// Reads a regular file of at most `most` bytes, `name` below the directory. Never waits for
-// anybody: pipes, devices and directories are not even opened. A kernel file whose size is said
-// to be 0 is read as well.
+// Reads a regular file of at most `most` bytes, `name` below the directory. Never waits for another
+// process: pipes, devices and directories are not even opened. Files of the kernel, whose size is
+// 0, are read too. Any thread may call.
 [[nodiscard]] SmallFile readSmallFile(int directory, const char* name, std::size_t most);
 
-// A directory to read files below; empty when there is none.
+// A directory to read files below; empty if it cannot be opened.
 [[nodiscard]] UniqueFd openDirectory(const char* path);
 [[nodiscard]] UniqueFd openDirectoryAt(int directory, const char* name);
 

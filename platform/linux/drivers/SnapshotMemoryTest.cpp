@@ -3,14 +3,14 @@
 #include "platform/linux/drivers/ReadingMaker.h"
 #include "platform/linux/drivers/testing/MadeReadings.h"
 
-// What a session's snapshot holds.
+// The memory of a session's snapshot.
 namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::size_t kChannels = 500;
 constexpr std::size_t kMostBytesPerChannel = 200;
 
-// Beside the list of channels, which all readings of a source share.
+// Not counting the list of channels, which all readings of a source share.
 std::size_t bytesOf(const Reading& reading) {
   return sizeof(Reading) + reading.values.capacity() * sizeof(reading.values.front());
 }
@@ -41,7 +41,7 @@ std::shared_ptr<const Reading> read(ReadingMaker& readings) {
   return readings.finish();
 }
 
-// The first reading pays for the descriptions, which all snapshots share.
+// The first reading allocates the descriptions, which all snapshots share.
 TEST(SnapshotMemoryTest, ASnapshotCostsAtMost200BytesAChannel) {
   ReadingMaker readings;
   const auto first = read(readings);

@@ -11,15 +11,25 @@
 
 namespace halvox::platform::linux_ {
 
-// Reads one source on a thread of its own, so that whoever asks waits no longer than a bound.
-// Nobody is given a reading that was begun before he asked; those who ask while a reading is made
-// share the next one. Any thread may ask. Owns the source. Its end waits for a reading that is
-// being made.
+// Reads one source on a thread of its own, so that a slow source holds up a session's start or stop
+// for a bounded time only.
+//
+//   made --startOpening()--> opening --> in time <--> late
+//
+// It is late after a reading that took too long, and in time after one that did not.
+//
+// Nobody receives a reading that began before the request: it would miss what was counted in
+// between. Requests that come during a reading share the next one.
+//
+// Any thread may ask. The service owns it; it owns the source. Its destructor waits for the reading
+// that is in progress.
 class SourceReader {
  public:
   using Clock = std::chrono::steady_clock;
 
+  // Both ends of a session wait for it on the reporting queue, and with them all other clients.
   static constexpr std::chrono::milliseconds kLongestWait{50};
+  // Once, when the service starts: what is missed then is missed for good.
   static constexpr std::chrono::milliseconds kLongestOpening{1000};
 
   // `longestWait` is the time that a reading may take.
@@ -29,29 +39,30 @@ class SourceReader {
   SourceReader& operator=(const SourceReader&) = delete;
   ~SourceReader();
 
-  // Begins to open the source; then waits until it has, or has taken too long, which is logged and
-  // makes it late. Once each, in this order, before all else.
+  // The first call begins to open the source. The second waits until it has opened; if it takes too
+  // long, that is logged and the source counts as late. Call each once, in this order, before
+  // everything else.
   void startOpening();
   void waitUntilOpen();
-  // What somebody asked for. Taken once, by the one who asked.
+  // A request for a reading. The thread that asked passes it to take(), once.
   struct Asked {
     std::uint64_t number = 0;  // of the first reading that is new enough
     bool isWaiting = false;
     std::chrono::milliseconds wait{};
     Clock::time_point deadline{};
   };
-  // Has the source begin with a reading, which may take so long; several sources can be at it at
-  // once.
+  // Asks for a reading, which may take that long. Does not block, so several sources can read at
+  // the same time.
   [[nodiscard]] Asked ask(std::chrono::milliseconds wait);
-  // The reading that was asked for; null, with a line in the log once in a row, when it does not
-  // come in time. A source that was late once is read, but nobody waits for it before a reading of
-  // it took no longer than allowed.
+  // Waits for the reading that was asked for; null if it does not come in time. The first time in a
+  // row is logged. After that the source is still read, but nobody waits for it until a reading has
+  // been in time again.
   [[nodiscard]] std::shared_ptr<const Reading> take(const Asked& asked);
 
  private:
   using ReadingPointer = std::shared_ptr<const Reading>;
 
-  // Null when it is late; sets whether it was not late before.
+  // Null if the reading is late. Sets whether the source was in time before.
   [[nodiscard]] ReadingPointer receive(const Asked& asked, bool& isFirstLate);
   void run();
   void makeReadings() HALVOX_REQUIRES(mutex_);
@@ -64,18 +75,19 @@ class SourceReader {
   Counter& received_;
   Counter& given_;
   Counter& late_;
-  Asked opening_{};  // of the thread that opens
+  Asked opening_{};  // used by the thread that opens the source
   Mutex mutex_;
   Condition wanted_;
   Condition made_;
   bool isEnding_ HALVOX_GUARDED_BY(mutex_) = false;
-  bool isLate_ HALVOX_GUARDED_BY(mutex_) = false;  // logged, and not come round yet
-  // Readings are numbered from 1 on: the last that somebody wants, that was begun, that was made.
+  bool isLate_ HALVOX_GUARDED_BY(mutex_) = false;  // logged, and not in time again yet
+  // Readings are numbered from 1: the latest one that was asked for, that began, that is finished.
   std::uint64_t lastWanted_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t lastBegun_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t lastMade_ HALVOX_GUARDED_BY(mutex_) = 0;
   int waiting_ HALVOX_GUARDED_BY(mutex_) = 0;
-  // The last made, held only while somebody waits: a source looks at who holds its readings.
+  // The latest reading. Kept only while someone waits, because a source may look at whether its
+  // readings are still held.
   ReadingPointer handedOver_ HALVOX_GUARDED_BY(mutex_);
   std::thread thread_;
 };

@@ -1,4 +1,4 @@
-// The contract of results files, kept by JSON files.
+// The contract of results files, run on JSON files.
 
 #include <filesystem>
 #include <fstream>
@@ -30,7 +30,7 @@ class JsonResultsFileHarness {
     document.Parse<rapidjson::kParseFullPrecisionFlag>(text.data(), text.size());
     if (document.HasParseError()) return std::nullopt;
     ResultsFileContent content{document["product"].GetString(), document["version"].GetUint(), {}};
-    // Not as a range: clang cannot compare the iterators of this library's objects.
+    // Not a range-based loop: clang 14 cannot compare the iterators of this library's objects.
     const rapidjson::Value& all = document["values"];
     for (auto member = all.MemberBegin(); !(member == all.MemberEnd()); ++member) {
       std::vector<double> values;

@@ -7,20 +7,22 @@
 
 namespace halvox::platform::linux_ {
 
-// Results files as JSON, below a root:
+// Writes results files as JSON, below a root:
 //
 //   {"product": "HVReporting", "version": 4, "unit": "ns", "values": {"IOStart": [1250, 1310]}}
 //
-// Names stand in the order in which their first values came, the values of one name in the order in
-// which they came. Numbers are written so that reading them gives the same double. What is no
-// number, which JSON does not have, is null. A file has its name, in the place of one that had it,
-// when it is whole and on the disk. No symbolic link below the root is followed.
+// Names are in the order of their first values, and the values of a name in the order in which they
+// came. A number is written with enough digits that reading it gives the same double. NaN and the
+// infinities, which JSON does not have, are null.
 //
-// Any thread may call. A file that cannot be finished is logged and counted; what had its name
-// before stays.
+// A file appears under its name, and replaces an older one, when it is complete and on the disk. No
+// symbolic link below the root is followed.
+//
+// Any thread may call. The composition root owns the service. A file that cannot be written is
+// logged and counted; an older file of that name stays.
 class JsonResultsFileService final : public ResultsFileService {
  public:
-  // The statistics must outlive the service, the service its writers.
+  // The statistics must outlive the service, and the service its writers.
   JsonResultsFileService(std::filesystem::path root, StatisticsService& statistics);
 
   Writer sswriter_open(std::string_view path, std::string_view productName, std::uint32_t version,

@@ -1,4 +1,4 @@
-// The contract of property lists, kept by files that libplist reads.
+// The contract of property lists, run on libplist.
 
 #include <fstream>
 

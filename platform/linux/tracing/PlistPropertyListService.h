@@ -4,20 +4,24 @@
 
 namespace halvox::platform::linux_ {
 
-// Property lists in XML and binary form, told apart by their content, read by libplist.
-// Only regular files of at most 16 MiB are read, and nothing waits for another process, such as the
-// writer of a pipe. Lists of more than 64 levels, 500,000 values or 32 MiB of text are errors, also
-// when a binary list gets so large by using a value many times. Any thread may call.
+// Reads property lists in XML and binary form with libplist; the content decides which form it is.
+//
+// Clients name the files, so everything is bounded before the library sees it. Only regular files
+// of at most 16 MiB are read, without waiting for another process such as the writer of a pipe.
+// More than 64 levels, 500,000 values or 32 MiB of text are errors, also if a binary list reaches
+// them by using one value many times.
+//
+// Any thread may call; reading waits for the disk. The composition root owns the service.
 class PlistPropertyListService final : public PropertyListService {
  public:
   static constexpr std::size_t kMostFileBytes = 16U << 20U;
 
   [[nodiscard]] std::string currentDirectory() const override;
-  // Errors name the path.
+  // Errors name the path and the system's reason.
   [[nodiscard]] std::optional<Data> readFile(std::string_view path,
                                              std::optional<Error>& error) const override;
-  // A text becomes a string, a key of a dictionary too, with what is not UTF-8 replaced; a unique
-  // identifier becomes its number.
+  // Keys and texts that are not UTF-8 have the wrong bytes replaced. A unique identifier becomes
+  // its number.
   [[nodiscard]] std::optional<Value> parse(const std::optional<Data>& bytes,
                                            std::optional<Error>& error) const override;
 };

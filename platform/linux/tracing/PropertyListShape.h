@@ -7,21 +7,26 @@
 
 namespace halvox::platform::linux_ {
 
-// How large a property list may become when it is read.
+// The largest property list that is read. Real lists are far smaller; the bounds keep a hostile one
+// from taking the service's memory or stack.
 struct PropertyListBounds {
   std::size_t depth = 64;            // levels of containers
-  std::uint64_t elements = 500'000;  // values and keys, shared ones as often as they are used
-  std::uint64_t bytes = 32U << 20U;  // of texts and data, shared ones likewise
+  std::uint64_t elements = 500'000;  // values and keys; a shared one counts for each use
+  std::uint64_t bytes = 32U << 20U;  // of texts and data; a shared one counts for each use
 };
 
-// Why these bytes must not be given to the library that reads property lists: it goes one step down
-// its stack for each level, and makes a copy of each value that a binary list uses twice, so that
-// few bytes could become any number of values. None when they are within the bounds; they may still
-// be no property list. Allocates a few bytes for each object of a binary list.
+// Why these bytes must not be given to libplist; none if they are within the bounds. They may still
+// not be a property list: the library finds that out.
+//
+// The check comes first because the library cannot be stopped. It recurses for each level until the
+// stack ends, copies each value that a binary list uses twice, so a few bytes can become any number
+// of values, and ends the process by an assertion at a key with a NUL.
+//
+// Allocates a few bytes for each object of a binary list. Any thread may call.
 [[nodiscard]] std::optional<std::string> whyUnreadable(std::string_view bytes,
                                                        const PropertyListBounds& bounds);
 
-// True for the binary form; everything else is taken for XML.
+// True for the binary form. Everything else is treated as XML.
 [[nodiscard]] bool isBinaryPropertyList(std::string_view bytes);
 
 }  // namespace halvox::platform::linux_

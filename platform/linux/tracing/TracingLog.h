@@ -4,7 +4,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The log category of the adapters of this folder; made when it is first used.
+// The log category of the adapters in this folder. The first call makes it. Any thread may call.
 LogCategory& tracingCategory();
 
 }  // namespace halvox::platform::linux_

@@ -13,12 +13,12 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr std::size_t kLargestFile = 16'384;
-constexpr std::size_t kMostEntries = 256;  // cards, PCMs of a card, substreams of a PCM
+constexpr std::size_t kLargestFile = 16'384;  // bytes
+constexpr std::size_t kMostEntries = 256;     // cards, PCMs of a card, substreams of a PCM
 
 using Directory = UniqueHandle<DIR*, ::closedir>;
 
-// True for a name such as "card0": the letters, then a number.
+// The number after the letters, for a name such as "card0"; none for any other name.
 std::optional<unsigned> numberBehind(std::string_view name, std::string_view letters) {
   if (!name.starts_with(letters)) return std::nullopt;
   const auto number = parseSysfsNumber(name.substr(letters.size()));
@@ -69,6 +69,7 @@ std::shared_ptr<const Reading> AlsaSource::read() {
                {nameFor(folder, name == names.end() ? folder : name->second, *number)});
     }
   }
+  // What was not seen in this round has gone. A card that returns begins to count anew.
   const auto isGone = [this](const auto& item) { return item.second.round != round_; };
   std::erase_if(substreams_, isGone);
   std::erase_if(powers_, isGone);
@@ -76,8 +77,8 @@ std::shared_ptr<const Reading> AlsaSource::read() {
   return readings_.finish();
 }
 
-// Of several cards of one name those that came later are told apart by their number. A card keeps
-// what it was called when another goes: it is no other card by that.
+// If several cards have the same name, the later ones get their number. A card keeps its name when
+// another one disappears, because it is still the same card and its counts go on.
 std::string AlsaSource::nameFor(const std::string& folder, const std::string& name,
                                 unsigned number) {
   const auto known = cardNames_.find(folder);
@@ -112,7 +113,7 @@ void AlsaSource::readPcm(int cardDirectory, const std::string& path, const std::
   const UniqueFd directory = openDirectoryAt(cardDirectory, folder.c_str());
   if (!directory) return;
   std::string name = parsePcmName(textOf(directory.get(), "info").value_or("")).value_or(folder);
-  // Of several devices of one name the later ones are told apart by their number.
+  // If several devices have the same name, the later ones get a number.
   const int others = card.pcmNames[(isPlayback ? "p" : "c") + name]++;
   if (others > 0) name += " " + std::to_string(others + 1);
 
@@ -167,10 +168,12 @@ void AlsaSource::readPower(const std::string& folder, const Card& card) {
   if (!directory) return;
   const auto active = numberIn(directory.get(), "runtime_active_time");
   const auto suspended = numberIn(directory.get(), "runtime_suspended_time");
+  // Devices without runtime power management have no such files.
   if (!active.has_value() || !suspended.has_value()) return;
   const bool isSuspended =
       cleanText(textOf(directory.get(), "runtime_status").value_or("")) == "suspended";
 
+  // The kernel counts the times but not the transitions, so these are what two readings show.
   const bool isNew = !powers_.contains(folder);
   Power& power = powers_[folder];
   power.round = round_;

@@ -13,22 +13,26 @@
 
 namespace halvox::platform::linux_ {
 
-// What the kernel's sound cards tell below /proc/asound and /sys/class/sound.
+// Reads what the kernel tells about sound cards below /proc/asound and /sys/class/sound.
 //
 //   group                     subgroup      channels
 //   "Tx" playback,            the PCM       "frames", "application frames", "state"
 //   "Rx" capture
 //   "StateTransitionTimes_ms" "Runtime"     "power": active and suspended
 //
-// The driver is the card's name; of several cards of one name the later ones have their number
-// behind it. Of a PCM with several substreams the others than the first have their number in the
-// channel's name. Whatever is not there, or goes while it is read, is left out.
+// The driver is the card's name. If several cards have the same name, the later ones are reported
+// as "name <card number>". If a PCM has several substreams, all but the first have their number in
+// the channel's name. What is missing, or disappears while it is read, is skipped without a log
+// line: cards come and go.
+//
+// Its SourceReader owns it and calls it on one thread.
 class AlsaSource final : public DriverSource {
  public:
   using Clock = PcmCounters::Clock;
-  static constexpr std::size_t kMostChannels = 4000;
+  static constexpr std::size_t kMostChannels =
+      4000;  // of all cards; far more than real machines have
 
-  // `now` is asked once a reading.
+  // `now` is called once for each reading, so that all its channels have the same time.
   explicit AlsaSource(std::filesystem::path root,
                       std::function<Clock::time_point()> now = Clock::now)
       : root_(std::move(root)), now_(std::move(now)) {}
@@ -39,11 +43,11 @@ class AlsaSource final : public DriverSource {
  private:
   struct Card {
     std::string name;
-    std::map<std::string, int> pcmNames{};  // how often each, with its direction
+    std::map<std::string, int> pcmNames{};  // how often each name with its direction was found
   };
   struct CardName {
-    std::string own;    // as the kernel tells it
-    std::string shown;  // as no other card is called
+    std::string own;    // from the kernel
+    std::string shown;  // unique among the cards
     std::uint64_t round = 0;
   };
   struct Substream {

@@ -21,7 +21,7 @@ using testing::samplesOf;
 using ::testing::SizeIs;
 using ::testing::StartsWith;
 
-// Works on a copy of a recorded tree, with a clock of its own.
+// Works on a copy of a recorded tree, with a clock that it sets.
 class AlsaSourceTest : public ::testing::Test {
  protected:
   void use(const char* tree) {
@@ -38,7 +38,7 @@ class AlsaSourceTest : public ::testing::Test {
               "\ntrigger_time: 1.0\n-----\nhw_ptr      : " + std::to_string(hardware) +
               "\nappl_ptr    : " + std::to_string(application) + "\n");
   }
-  // The same card once more, in another socket.
+  // A second card of the same model, in another socket.
   void addTwinOfUsbCard() {
     for (const char* folder : {"proc/asound/", "sys/class/sound/"}) {
       std::filesystem::copy(root_.path() / folder / "card1", root_.path() / folder / "card2",
@@ -197,7 +197,7 @@ TEST_F(AlsaSourceTest, ACardThatIsPluggedInAgainIsAnother) {
   EXPECT_THAT(show(), Contains("Scarlet Two/Tx/USB Audio/frames frames = 480"));
 }
 
-// A link to nowhere stands in its directory, and cannot be opened any more.
+// A dangling link is in its directory and cannot be opened.
 TEST_F(AlsaSourceTest, WhatIsGoneWhenItsDirectoryHasBeenListedIsLeftOut) {
   use("analogue");
   const auto asound = root_.path() / "proc/asound";

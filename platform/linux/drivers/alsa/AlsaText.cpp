@@ -24,7 +24,7 @@ std::optional<Number> numberIn(std::string_view text) {
   return number;
 }
 
-// Gives each line of the text, without its end.
+// Passes each line of the text without its end.
 template <typename Take>
 void forEachLine(std::string_view text, Take take) {
   while (!text.empty()) {
@@ -34,7 +34,8 @@ void forEachLine(std::string_view text, Take take) {
   }
 }
 
-// The value behind "key:" at the start of a line, blanks around both; none without such a line.
+// The value after "key:" at the start of a line, without surrounding blanks; none if no line has
+// it.
 std::optional<std::string_view> valueOf(std::string_view text, std::string_view key) {
   std::optional<std::string_view> value;
   forEachLine(text, [&](std::string_view line) {
@@ -75,7 +76,8 @@ std::optional<std::string> parsePcmName(std::string_view text) {
   return std::nullopt;
 }
 
-// " 0 [PCH            ]: HDA-Intel - HDA Intel PCH", and a line with the long name.
+// A card is two lines: " 0 [PCH            ]: HDA-Intel - HDA Intel PCH" and one with the long
+// name.
 std::map<unsigned, std::string> parseCards(std::string_view text) {
   constexpr std::string_view kBeforeDriver = "]: ";
   constexpr std::string_view kBeforeName = " - ";

@@ -9,32 +9,32 @@
 
 namespace halvox::platform::linux_ {
 
-// The states of a PCM substream in the words of the kernel, that of a closed one first.
+// The states of a PCM substream, in the kernel's words; that of a closed one comes first.
 inline constexpr std::array<std::string_view, 10> kPcmStates{
     "CLOSED", "OPEN",     "SETUP",  "PREPARED",  "RUNNING",
     "XRUN",   "DRAINING", "PAUSED", "SUSPENDED", "DISCONNECTED"};
 
-// What /proc/asound/cardN/pcmND/subN/status tells.
+// The content of /proc/asound/cardN/pcmND/subN/status.
 struct PcmStatus {
-  std::size_t state = 0;  // position in kPcmStates
-  std::int64_t owner = 0;
+  std::size_t state = 0;                // position in kPcmStates
+  std::int64_t owner = 0;               // process; 0 if unknown
   std::uint64_t hardwareFrames = 0;     // hw_ptr
   std::uint64_t applicationFrames = 0;  // appl_ptr
 };
 
-// None when it is not what the kernel writes.
+// None if the text is not what the kernel writes.
 [[nodiscard]] std::optional<PcmStatus> parsePcmStatus(std::string_view text);
 
-// The name of a PCM in its info file: its name, else its ID. None without either.
+// The name of a PCM from its info file, or its ID if it has no name. None if it has neither.
 [[nodiscard]] std::optional<std::string> parsePcmName(std::string_view text);
 
-// The names of the cards in /proc/asound/cards, by number.
+// The names of the cards in /proc/asound/cards, by card number.
 [[nodiscard]] std::map<unsigned, std::string> parseCards(std::string_view text);
 
-// A number alone on its line, as files of sysfs have it.
+// A number that is alone on its line, as in files of sysfs. None for anything else.
 [[nodiscard]] std::optional<std::uint64_t> parseSysfsNumber(std::string_view text);
 
-// What of `text` is no blank at either end; bytes that are not UTF-8 become U+FFFD.
+// The text without white space at its ends; bytes that are not UTF-8 become U+FFFD.
 [[nodiscard]] std::string cleanText(std::string_view text);
 
 }  // namespace halvox::platform::linux_

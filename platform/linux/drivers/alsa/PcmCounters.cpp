@@ -8,6 +8,7 @@ void PcmCounters::look(const PcmStatus& status, Clock::time_point now) {
         std::chrono::duration_cast<std::chrono::microseconds>(now - lastTime_);
     if (last_->state != status.state) ++states_[status.state].transitions;
   }
+  // A new stream has another owner, or its pointer is behind the old one.
   const bool isNewStream =
       !last_.has_value() || last_->owner != status.owner || status.hardwareFrames < hardware_.last;
   count(hardware_, status.hardwareFrames, isNewStream);
@@ -18,7 +19,7 @@ void PcmCounters::look(const PcmStatus& status, Clock::time_point now) {
 
 void PcmCounters::count(Pointer& pointer, std::uint64_t now, bool isNewStream) {
   const std::uint64_t before = isNewStream ? 0 : pointer.last;
-  // An application may take back what it has written; it then counts when it is written again.
+  // An application may rewind its pointer. The frames count when it writes them again.
   if (now < before) return;
   pointer.total += now - before;
   pointer.last = now;

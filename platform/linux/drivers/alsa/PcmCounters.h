@@ -9,10 +9,12 @@
 
 namespace halvox::platform::linux_ {
 
-// Counts one PCM substream over its streams. The kernel's pointers begin anew with each stream; the
-// counts here go on. What happens between two looks and leaves no trace is not seen: a state holds
-// from the look that found it to the look that finds another.
-// Belongs to the source's thread.
+// Counts one PCM substream across its streams: the kernel's pointers restart with each stream, and
+// the counts here continue.
+//
+// The kernel keeps no history. A state is taken to hold from the look that found it to the look
+// that finds another; what happens between two looks and leaves no trace is not counted. Belongs to
+// the source's thread.
 class PcmCounters {
  public:
   using Clock = std::chrono::steady_clock;
@@ -22,6 +24,7 @@ class PcmCounters {
     std::chrono::microseconds residency{};
   };
 
+  // Takes the status at a time. Times must not go back.
   void look(const PcmStatus& status, Clock::time_point now);
 
   [[nodiscard]] std::uint64_t hardwareFrames() const { return hardware_.total; }

@@ -13,10 +13,10 @@
 #include "platform/linux/drivers/DriverSamples.h"
 #include "platform/linux/drivers/DriverSource.h"
 
-// What tests of this folder share.
+// Shared by the tests of this folder.
 namespace halvox::platform::linux_::testing {
 
-// Gives the readings that a test makes.
+// A source with the readings that a test makes.
 class MadeSource final : public DriverSource {
  public:
   using Make = std::function<std::shared_ptr<const Reading>()>;
@@ -28,7 +28,7 @@ class MadeSource final : public DriverSource {
   const Make make_;
 };
 
-// A counter.
+// A counter channel.
 inline ChannelList::Channel simpleChannel(std::string group, std::string name) {
   ChannelDescription channel;
   channel.kind = IOReportKind::kCounter;
@@ -65,7 +65,7 @@ inline std::shared_ptr<const Reading> makeReading(std::vector<ChannelList::Chann
   return reading;
 }
 
-// A channel as a reader of samples sees it, on one line:
+// A channel as one line:
 //   driver/group/subgroup/name unit = what its format has
 inline std::string describe(const IOReportChannel& channel) {
   std::string text;
@@ -101,7 +101,7 @@ inline std::vector<std::string> describe(const DriverSamples& samples) {
   return lines;
 }
 
-// All channels of a reading.
+// Samples with all channels of a reading.
 inline DriverSamples samplesOf(std::shared_ptr<const Reading> reading) {
   auto all = std::make_shared<ChannelSelection>();
   for (std::uint32_t index = 0; index < reading->channels->size(); ++index) all->push_back(index);

@@ -15,23 +15,25 @@ namespace halvox::platform::linux_ {
 struct MetricChannel {
   ChannelDescription description;
   std::vector<std::uint64_t> values;
-  std::size_t line = 0;  // where it begins
+  std::size_t line = 0;  // where the file begins to describe it
 };
 
-// The driver channels of a text file's metrics.
+// Makes driver channels from the metrics of a text file.
 //
-//   counter                 a simple channel that is a counter; a fraction is cut off
-//   gauge                   a simple channel that is a gauge; a fraction is cut off
+//   counter                 a simple channel that is a counter; a fraction is rounded down
+//   gauge                   a simple channel that is a gauge; a fraction is rounded down
 //   histogram               a histogram channel
-//   stateset NAME, with     a state channel; the label NAME tells the state
+//   stateset NAME, with     a state channel; the label NAME names the state
 //     NAME_residency and
 //     NAME_transitions
 //
-// The labels driver, group, subgroup, channel and unit say what the channel is called; any other
-// label is added to the channel's name. Metrics of other types are no channels.
+// The labels driver, group, subgroup, channel and unit name the channel. Any other label is
+// appended to the channel's name. Metrics of other types are ignored. Pure functions; any thread
+// may call.
 class MetricChannels {
  public:
-  // What contradicts itself is an error: then there is no channel at all.
+  // The channels, or the first error. A text with a contradiction gives no channel at all: half of
+  // a file would be reported as if it were complete.
   [[nodiscard]] static std::variant<std::vector<MetricChannel>, MetricError> from(
       std::string_view text);
 };

@@ -16,17 +16,18 @@ enum class MetricType : std::uint8_t {
   kGauge,
   kHistogram,
   kStateset,
-  kOther,  // valid, but nothing that a driver channel could be made of
+  kOther,  // valid, but cannot become a driver channel
 };
 
-// A number as it was written. Whole numbers of 64 bits keep all their digits.
+// A number as it was written. An integer of 64 bits keeps all its digits, which a double would lose
+// above 2^53.
 struct MetricNumber {
   double value = 0;
   std::optional<std::int64_t> whole{};
 
-  // None when the text is no number.
+  // None if the text is not a number.
   [[nodiscard]] static std::optional<MetricNumber> parse(std::string_view text);
-  // The number, cut down to a whole one; none when 64 bits cannot hold it.
+  // The number rounded down to an integer; none if 64 bits cannot hold it, or for a NaN.
   [[nodiscard]] std::optional<std::int64_t> cutDown() const;
 };
 
@@ -37,11 +38,11 @@ struct MetricLabel {
   // NOLINTNEXTLINE(modernize-use-nullptr): what the compiler makes of the operator
   friend auto operator<=>(const MetricLabel&, const MetricLabel&) = default;
 };
-using MetricLabels = std::vector<MetricLabel>;  // in the order of their names
+using MetricLabels = std::vector<MetricLabel>;  // sorted by name
 
 // One line with a value.
 struct MetricSample {
-  std::string suffix;  // what the sample's name has behind that of its family: "_total"
+  std::string suffix;  // the part of the sample's name after the family's, such as "_total"
   MetricLabels labels;
   MetricNumber number;
   std::size_t line = 0;
@@ -61,9 +62,12 @@ struct MetricError {
   std::string what{};
 };
 
-// Metrics as text, in the form of OpenMetrics or in the older one of the text files that exporters
-// collect, which has no "# EOF". The text comes from anybody: whatever is not as it should be is an
-// error, and all sizes have a bound.
+// Parses metrics in the OpenMetrics text format, or in the older format of exporters' text files,
+// which has no "# EOF".
+//
+// Anyone may write these files, so nothing is trusted: everything that is not as the format demands
+// is an error, and all sizes are bounded. The bounds are far above real files; they keep one file
+// from taking the service's memory or its 50 ms. Pure functions; any thread may call.
 class OpenMetricsText {
  public:
   static constexpr std::size_t kLargestText = 1U << 20U;
@@ -73,7 +77,7 @@ class OpenMetricsText {
 
   using Families = std::vector<MetricFamily>;
 
-  // The families in the order in which they begin.
+  // The families in the order in which they begin, or the first error.
   [[nodiscard]] static std::variant<Families, MetricError> parse(std::string_view text);
 };
 

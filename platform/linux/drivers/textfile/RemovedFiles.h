@@ -9,21 +9,26 @@
 
 namespace halvox::platform::linux_ {
 
-// Notices which files were deleted from a directory since it was last asked, also when files of the
-// same names are there again. A file that another one is renamed over was not deleted: so are files
-// updated. Nothing wakes up for it: the kernel keeps the names until somebody asks.
-// Belongs to one thread. Without the directory, or without inotify, it notices nothing; the latter
-// is logged once. A directory that is made later is watched from the next time on.
+// Finds out which files were deleted from a directory since the last call, even if files with the
+// same names exist again. A file that another one was renamed over was not deleted: that is how
+// files are updated.
+//
+// It uses inotify, but no thread waits for it: the kernel keeps the names until someone asks, so an
+// idle service makes no wake-ups. Belongs to one thread; the source owns it.
+//
+// Without the directory it reports nothing, and watches the directory once it exists. Without
+// inotify it reports nothing either, which is logged once.
 class RemovedFiles {
  public:
   struct Removed {
-    bool areAll = false;  // the directory itself was replaced, or too many to remember
+    bool areAll =
+        false;  // the directory was replaced, or more files were deleted than the kernel keeps
     std::vector<std::string> names{};
   };
 
   explicit RemovedFiles(std::filesystem::path directory) : directory_(std::move(directory)) {}
 
-  // Those since the last call; none the first time. Does not block.
+  // The files since the last call; none the first time. Does not block.
   [[nodiscard]] Removed take();
 
  private:
@@ -31,7 +36,7 @@ class RemovedFiles {
 
   const std::filesystem::path directory_;
   UniqueFd inotify_;
-  int watched_ = -1;  // the watch of the directory; -1: none
+  int watched_ = -1;  // the watch on the directory; -1 if there is none
   bool isFailureLogged_ = false;
 };
 

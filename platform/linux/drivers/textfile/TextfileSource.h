@@ -18,16 +18,20 @@
 
 namespace halvox::platform::linux_ {
 
-// What other daemons count and write as metrics into the files *.prom of one directory. A file that
-// is wrong, too large or no file is left out as a whole, with one line in the log for each change
-// of it, and so are the files for which no room is left. A file that did not change costs a look at
-// its size and times. Files in the order of their names; of a channel that two files tell the first
-// file's counts. A file that is deleted takes its channels with it: those of a file of the same
-// name that comes later are others.
+// Reads what other daemons count, from files with metrics in one directory (*.prom).
+//
+// A file that has an error, is too large or is not a regular file is skipped as a whole, and logged
+// once for each change of the file. So are files beyond the total size. If two files have the same
+// channel, the one that sorts first by name is used. A file that is deleted takes its channels with
+// it: a later file of the same name has new channels.
+//
+// A file that has not changed is not read again; its size and times are compared. Its SourceReader
+// owns the source and calls it on one thread.
 class TextfileSource final : public DriverSource {
  public:
   static constexpr std::size_t kMostFiles = 1000;
-  // Of all files together, as what they tell is kept.
+  // For all files together, because the content of all of them is kept in memory. Fifty files of 1
+  // MiB took the service to half a gigabyte.
   static constexpr std::size_t kMostBytes = 8U << 20U;
 
   explicit TextfileSource(std::filesystem::path directory)
@@ -39,7 +43,7 @@ class TextfileSource final : public DriverSource {
  private:
   using Channel = ReadingMaker::Channel;
 
-  // By what a change of a file is noticed.
+  // A file has changed if one of these has.
   struct State {
     int error = 0;
     dev_t device = 0;
@@ -51,13 +55,13 @@ class TextfileSource final : public DriverSource {
   };
   struct Entry {
     State state{};
-    bool isSettled = false;             // the state tells every further change
+    bool isSettled = false;             // any further change will show in the state
     std::optional<std::size_t> hash{};  // of the content, if it could be read
     bool isGood = false;
-    std::vector<Channel> channels{};  // kept while the file is wrong, for their identity
+    std::vector<Channel> channels{};  // kept while the file has an error, for their identity
     std::vector<std::vector<std::uint64_t>> values{};
-    std::vector<bool> isShown{};  // false: a file before it tells the channel
-    std::string complaint{};      // the last that was logged of this state
+    std::vector<bool> isShown{};  // false if an earlier file has the same channel
+    std::string complaint{};      // the latest log line about this state
     std::uint64_t round = 0;
   };
 
@@ -73,7 +77,7 @@ class TextfileSource final : public DriverSource {
   std::map<std::string, Entry> entries_;  // by file name
   std::uint64_t round_ = 0;
   bool hasToldOfTooMany_ = false;
-  bool isChanged_ = false;  // some file, since the channels were chosen
+  bool isChanged_ = false;  // a file has changed since the channels were chosen
   ReadingMaker readings_;
 };
 

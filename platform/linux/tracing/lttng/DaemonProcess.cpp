@@ -12,12 +12,13 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr std::chrono::milliseconds kLookEvery{10};  // at a process that tells nobody
+// The process is not our child, so there is nothing to wait on.
+constexpr std::chrono::milliseconds kLookEvery{10};
 
 std::string startTimeOf(pid_t pid) {
   std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
   std::string text((std::istreambuf_iterator<char>(file)), {});
-  // The name, which may hold anything, ends at the last bracket; the start time is the 22nd field.
+  // The process name may contain anything, and ends at the last ")". The start time is field 22.
   const std::size_t name = text.rfind(')');
   if (name == std::string::npos) return {};
   constexpr int kFieldsBetween = 20;
@@ -78,7 +79,7 @@ int startApart(const ProgramApart& program, pid_t& pid) {
   addStream(actions, -1, STDERR_FILENO);
   posix_spawnattr_t attributes;
   ::posix_spawnattr_init(&attributes);
-  // Our threads block all signals and the service ignores some; other programs expect neither.
+  // Our threads block all signals and the service ignores some. Other programs expect neither.
   sigset_t signals;
   ::sigemptyset(&signals);
   if (program.endSignals == ProgramApart::EndSignals::kBlocked) {

@@ -10,29 +10,32 @@
 
 namespace halvox::platform::linux_ {
 
-// A tracer's daemon by its number and by when it started, as the kernel tells it: another process
-// that gets the number later is never taken for it. A value; any thread may call.
+// Identifies a process by its number and its start time, both from the kernel. The kernel reuses
+// numbers, and a signal must not reach another process that got the number later.
+//
+// A plain value. Any thread may call.
 struct DaemonProcess {
   pid_t pid = 0;
   std::string startTime{};
 
-  // The process that has the number now. Its start time is empty when there is none.
+  // The process that has the number now. The start time is empty if there is none.
   [[nodiscard]] static DaemonProcess withNumber(pid_t pid);
-  // What `write` left in the file; none when it names no process.
+  // The process that `write` noted in the file; none if the file names no process.
   [[nodiscard]] static std::optional<DaemonProcess> read(const std::filesystem::path& noteFile);
-  // False when the file cannot be written.
+  // Notes the process in the file. Returns false if the file cannot be written.
   [[nodiscard]] bool write(const std::filesystem::path& noteFile) const;
 
-  // A process that has ended and that nobody waited for is not alive.
+  // A process that has ended but that its parent has not waited for does not count as alive.
   [[nodiscard]] bool isAlive() const;
-  // Ends the process by SIGTERM, or by SIGKILL when it has not ended within that time. Waits until
-  // it is gone, at most twice that time.
+  // Ends the process with SIGTERM, and with SIGKILL if it has not ended in time. Blocks until it
+  // has ended, at most for twice the time.
   void end(std::chrono::milliseconds within) const;
 };
 
-// A program to start apart from ours: in a session of its own, so that a terminal does not end it
-// before the traces are read, with signals that behave as usual, and with no descriptor of ours but
-// these. None: /dev/null.
+// How to start a program independent of ours: in a session of its own, because a Ctrl-C in the
+// service's terminal must not end the tracer before the traces are read; with default signal
+// handling, because our threads block signals; and with no descriptor of ours except these. -1
+// stands for /dev/null.
 struct ProgramApart {
   std::vector<std::string> command;  // the program is searched for in PATH unless it has a slash
   int input = -1;
@@ -40,7 +43,7 @@ struct ProgramApart {
   enum class EndSignals : bool { kHeeded, kBlocked } endSignals = EndSignals::kHeeded;
 };
 
-// 0 and the process, or the system's error.
+// Returns 0 and sets `pid`, or returns the system's error.
 [[nodiscard]] int startApart(const ProgramApart& program, pid_t& pid);
 
 }  // namespace halvox::platform::linux_

@@ -1,7 +1,8 @@
-// The contracts of kernel traces and of performance traces, kept by LTTng.
+// The contracts of kernel traces and performance traces, run on LTTng.
 //
-// The program is never root, whose tracer is the machine's own, and has a tracer's daemon of its
-// own. It is also the program whose events are recorded: with --emit it emits and ends.
+// The program never runs as root, because root's tracer is the machine's own; it has a session
+// daemon of its own. It is also the program whose events are recorded: with --emit it emits events
+// and ends.
 
 #include <csignal>
 #include <cstdio>
@@ -40,7 +41,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// A tracer's daemon of the test's own, in a home of its own. Ends with the test.
+// A session daemon for this test, with a home of its own. Ends with the test.
 class TestDaemon {
  public:
   TestDaemon() {
@@ -110,7 +111,7 @@ class LttngHarness {
   LttngHarness(const LttngHarness&) = delete;
   LttngHarness& operator=(const LttngHarness&) = delete;
   ~LttngHarness() {
-    std::error_code ignored;  // there may be none
+    std::error_code ignored;  // the directory may not exist
     fs::permissions(traces_, fs::perms::owner_all, ignored);
     ktrace_.stop();
     EXPECT_TRUE(dispatch_.stop(linux_::kTestDeadline));
@@ -122,7 +123,7 @@ class LttngHarness {
   }
 
   bool letRunUntil(const std::function<bool()>& condition) { return linux_::waitFor(condition); }
-  // What is recorded is there until it has been read back, packed or given up.
+  // The files of a recording exist until it has been read back, packed or given up.
   std::size_t recordings() {
     std::error_code ignored;
     const auto found = fs::directory_iterator(traces_ / "scratch", ignored);
@@ -130,7 +131,7 @@ class LttngHarness {
   }
   void breakTracer() {
     daemon_.end(SIGTERM);
-    ::setenv("PATH", "/nonexistent", 1);  // no other can be started
+    ::setenv("PATH", "/nonexistent", 1);  // so that no other daemon can be started
   }
   void breakRecorder() { daemon_.end(SIGKILL); }
   void breakSaving() { fs::permissions(traces_, fs::perms::owner_read | fs::perms::owner_exec); }
@@ -204,15 +205,15 @@ bool hasProgram(const std::string& name) {
 
 }  // namespace
 
-// What the tracer's own thread holds when the program ends is not ours to free. A build with
-// AddressSanitizer asks for this.
+// AddressSanitizer calls this. LTTng's own thread holds memory when the program ends, which we
+// cannot free.
 extern "C" const char* __lsan_default_suppressions() { return "leak:/liblttng-ust.so.1\n"; }
 
 int main(int count, char** arguments) {
   if (count > 1 && std::string_view(arguments[1]) == "--emit") return emitAll(count, arguments);
   testing::InitGoogleTest(&count, arguments);
   giveUpRoot();
-  // An emitter waits for the tracer, so that it emits nothing before the tracer listens.
+  // Wait for the tracer before emitting: events that it does not listen to yet are lost.
   ::setenv("LTTNG_UST_REGISTER_TIMEOUT", "10000", 1);
   if (!hasProgram("lttng-sessiond")) {
     std::puts("skipped: there is no lttng-sessiond");

@@ -12,24 +12,31 @@
 
 namespace halvox::platform::linux_ {
 
-// What a tracing session records, and where.
+// What a recording contains.
 struct RecordingPlan {
   std::string event;   // its name, or a pattern with *
-  std::string filter;  // an expression over the event's fields; empty: all
+  std::string filter;  // an expression over the event's fields; empty: no filter
   std::vector<std::string> exclusions{};
 };
 
-// The tracing sessions of this service in LTTng, and the daemon that it needs for them.
+// The recordings of this service in LTTng, and the session daemon that they need.
 //
-// Sessions have names that start with the identity of the storage directory, which one service at a
-// time has open: whatever bears such a name when the service starts was left by one before it. Each
-// records into a directory of its own below "scratch" in the traces' directory. While it does, an
-// empty file of its name is in "recording" beside that: whoever sees it knows that what is emitted
-// from now on is recorded.
+//   no daemon --begin()--> daemon runs, recordings begin and end --close()--> no daemon
 //
-// Any thread may call. Calls wait for the daemon, one at a time, because the control library is not
-// for several threads at once: this is the one lock here that is held while something else works.
-// Failures are texts.
+// The daemon is started by the first recording and ended with the service. One that somebody else
+// started is used and left running.
+//
+// Names: a recording has the name of its LTTng session, which begins with the device and inode
+// numbers of the traces' directory. One service at a time has that directory open, so a session
+// with this prefix that exists at the start was left by an earlier service and can be destroyed.
+//
+// Files: each recording writes into a directory of its own below "scratch" in the traces'
+// directory. While it records, an empty file of its name is in "recording" beside that; whoever
+// sees it knows that events from now on are recorded.
+//
+// Threads: any. Each call waits for the daemon, and calls wait for each other, because the control
+// library is not thread-safe. This lock is the only one here that is held during input and output.
+// Failure: a text for the log. The platform's trace services own this object.
 class LttngControl {
  public:
   using Failure = std::optional<std::string>;
@@ -38,21 +45,20 @@ class LttngControl {
     std::filesystem::path directory{};
   };
 
-  // Nothing is touched yet.
+  // Does nothing yet.
   explicit LttngControl(std::filesystem::path tracesDirectory);
   LttngControl(const LttngControl&) = delete;
   LttngControl& operator=(const LttngControl&) = delete;
 
-  // Destroys what a service before this one left and knows its daemon again. Cheap when it left
-  // nothing.
+  // Destroys what an earlier service left, and takes over its daemon. Cheap if nothing was left.
   void removeLeftovers();
-  // Begins to record, starting a session daemon if none answers.
+  // Begins to record. Starts a session daemon if none answers, which takes up to ten seconds.
   [[nodiscard]] Failure begin(const RecordingPlan& plan, Recording& recording);
-  // Stops and destroys the session; what it recorded is then whole in its directory.
+  // Stops and destroys the LTTng session. When it returns, the recording is complete on the disk.
   [[nodiscard]] Failure end(const Recording& recording);
-  // Removes what was recorded.
+  // Deletes the files of a recording.
   void discard(const Recording& recording);
-  // Destroys all our sessions, and ends the daemon if we started it and nobody else uses it.
+  // Destroys all our sessions. Ends the daemon if we started it and nobody else uses it.
   void close();
 
   [[nodiscard]] const std::filesystem::path& tracesDirectory() const { return tracesDirectory_; }

@@ -12,11 +12,13 @@ namespace halvox::platform::linux_ {
 
 class LttngKtraceSession;
 
-// Lets a reader be only so far ahead of the queue that it delivers to.
+// Keeps a reader from running further ahead of the queue that it delivers to than a number of
+// batches. Without it a trace that is read faster than its handlers work would be in memory as a
+// whole. Any thread may call; the service owns it.
 class DeliveryGate {
  public:
   explicit DeliveryGate(unsigned most) : most_(most) {}
-  // Waits for room; false when the service stops.
+  // Waits for room. Returns false if the service stops.
   [[nodiscard]] bool enter();
   void leave();
   void stop();
@@ -29,22 +31,29 @@ class DeliveryGate {
   bool isStopping_ HALVOX_GUARDED_BY(mutex_) = false;
 };
 
-// Kernel traces as sessions of LTTng's user-space tracer. The event "halvox:kdebug" is recorded,
-// filtered in the tracer to the codes that were asked for, with process, thread and process name.
+// Kernel traces as recordings of LTTng's user-space tracer.
 //
-// A start waits for the session daemon, which is started if there is none, and its error is logged
-// here in words. An end returns at once; a thread of the service then stops the session, reads
-// the trace back in the order of its times, and delivers the events in batches, of which only a few
-// wait at a time. Events that the tracer had no room for are counted and logged once a trace.
-// A trace without ranges records nothing. Nothing of a trace stays on the disk.
+//   made --ktrace_start--> started --ktrace_end--> ended   (read back on the service's thread)
+//        --ktrace_session_destroy from any state--> destroyed
+//
+// It records the event "halvox:kdebug" with process, thread and process name. LTTng itself filters
+// by the codes that were subscribed to, so that other programs' events cost no space. A trace
+// without ranges records nothing.
+//
+// Threads: a start waits for the session daemon on the caller's thread, and starts one if there is
+// none. An end returns at once; a thread of the service then stops the recording, reads it back in
+// the order of time, and delivers the events in batches. The composition root owns the service.
+// Failure: logged once and counted, and the session completes all the same. Events that the tracer
+// had no room for are counted and logged once a trace. No file of a trace remains.
 class LttngKtraceService final : public KtraceService {
  public:
   // Both must outlive the service.
   LttngKtraceService(LttngControl& control, StatisticsService& statistics);
 
-  // Nothing waits for queues any more; what is still to be delivered is not.
+  // From now on nothing waits for queues. Events that have not been delivered are dropped and
+  // counted.
   void stop();
-  // Lets go of the queue; after the queues have ended.
+  // Releases the queue. Call it after the queues have ended.
   void close();
 
   Session ktrace_session_create() override;
@@ -61,11 +70,11 @@ class LttngKtraceService final : public KtraceService {
 
  private:
   void finish(const std::shared_ptr<LttngKtraceSession>& session);
-  // Whether the recording could be read to its end.
+  // Returns whether the recording could be read to its end.
   bool deliverAll(const std::shared_ptr<LttngKtraceSession>& session);
   std::shared_ptr<DispatchQueue> readingQueue();
 
-  static constexpr unsigned kBatchesAhead = 8;
+  static constexpr unsigned kBatchesAhead = 8;  // of 4,096 events each
 
   LttngControl& control_;
   Counter& started_;

@@ -10,18 +10,23 @@
 
 namespace halvox::platform::linux_ {
 
-// Performance traces of all that user-space programs offer to LTTng: every "halvox" event and those
-// of other programs, with process, thread and process name. A trace that has ended is packed to
-// "<traces>/trace-<time>-<number>.tar.zst", in CTF, and its URL is "file://" and that path; of
-// these the newest 20 stay. All work is done, and delegates are called, on one thread of the
-// service. A delegate that has gone is not called; the trace is then dropped, and likewise one
-// whose session nobody holds any more.
+// Performance traces of everything that user-space programs offer to LTTng: the "halvox" events and
+// those of all other programs, with process, thread and process name.
+//
+// A trace that has ended is packed in CTF to "<traces>/trace-<time>-<number>.tar.zst". Its URL is
+// "file://" and that path. The newest 20 archives are kept and older ones deleted, because nothing
+// else deletes them.
+//
+// Threads: all work, and all calls of delegates, are on one thread of the service, in the order of
+// the requests. The composition root owns the service.
+// Failure: logged, counted, and reported to the delegate. A trace whose session nobody holds any
+// more is deleted without a call, and a delegate that has been destroyed is not called.
 class LttngPerformanceTraceService final : public PerformanceTraceService {
  public:
-  // Both must outlive the service, the service its sessions' work.
+  // Both must outlive the service and the work of its sessions.
   LttngPerformanceTraceService(LttngControl& control, StatisticsService& statistics);
 
-  // Lets go of the queue; after the queues have ended.
+  // Releases the queue. Call it after the queues have ended.
   void close();
 
   std::shared_ptr<KQTraceConfig> configWithTemplate(std::int32_t number) override;

@@ -17,6 +17,7 @@ class LttngTraceServices final : public TraceServices {
   PerformanceTraceService& performanceTraces() override { return performanceTraces_; }
   void open() override { control_.removeLeftovers(); }
   void stop() override { ktrace_.stop(); }
+  // Sessions and daemon first: the queues have ended, so nothing can use them any more.
   void close() override {
     control_.close();
     ktrace_.close();

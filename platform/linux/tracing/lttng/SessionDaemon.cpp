@@ -9,7 +9,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr std::chrono::milliseconds kLookEvery{10};  // at a daemon that tells nobody
+// The library has no call that waits for the daemon, so it is asked again and again.
+constexpr std::chrono::milliseconds kLookEvery{10};
 
 }  // namespace
 
@@ -24,11 +25,12 @@ void SessionDaemon::adopt(const std::string& ownSessions) {
   auto noted = DaemonProcess::read(noteFile_);
   if (!noted || !noted->isAlive()) return forget();
   process_ = std::move(noted);
-  // Should there be no keeper now, another one is tried at the end.
+  // If there is no keeper now, leave() tries again to start one.
   static_cast<void>(keeper_.keep({noteFile_, ownSessions_}, *process_));
 }
 
 std::optional<std::string> SessionDaemon::start(const std::string& ownSessions) {
+  // A daemon of ours that runs but does not answer would keep a new one from starting.
   end();
   ownSessions_ = ownSessions;
   DaemonProcess started;
@@ -56,7 +58,7 @@ void SessionDaemon::end() {
 
 void SessionDaemon::leave() {
   if (!process_.has_value()) return;
-  // Another one does the work of one that was killed.
+  // If the keeper was killed, another one does its work.
   if (!keeper_.release() && process_->isAlive() &&
       !keeper_.keep({noteFile_, ownSessions_}, *process_)) {
     keeper_.release();

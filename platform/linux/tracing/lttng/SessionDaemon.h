@@ -10,36 +10,41 @@
 
 namespace halvox::platform::linux_ {
 
-// The session daemon of LTTng, when it was started by us. Belongs to one thread at a time.
+// The session daemon of LTTng if this service started it. Belongs to one thread at a time;
+// LttngControl owns it.
 //
-// It ends with the service, however that ends, unless sessions of others are in it: its keeper sees
-// to that. A file tells which process it is, so that a service that starts later knows a daemon
-// that others used. A process is signalled only while its start time is the one that was noted.
+//   not ours --start() or adopt()--> ours --end() or leave()--> not ours
+//
+// The daemon must not outlive the service, however the service ends, unless others use it. Its
+// keeper (TracerKeeper) ensures that. A file notes the process, so that a later service recognises
+// a daemon that stayed because others used it. A process is signalled only while its start time is
+// the noted one.
 class SessionDaemon {
  public:
   struct Limits {
+    // A daemon takes about 0.4 s to start; the rest is for a busy machine.
     std::chrono::milliseconds answersWithin{10'000};
-    std::chrono::milliseconds endsWithin{5'000};  // of a signal; then it is killed
+    std::chrono::milliseconds endsWithin{5'000};  // after SIGTERM; then it is killed
   };
 
-  // The file is in a directory that exists before the daemon is started.
+  // The directory of the file must exist before the daemon is started.
   explicit SessionDaemon(std::filesystem::path noteFile) : SessionDaemon(std::move(noteFile), {}) {}
   SessionDaemon(std::filesystem::path noteFile, Limits limits)
       : noteFile_(std::move(noteFile)), limits_(limits) {}
 
-  // Takes over the daemon that the file names, if it still runs; otherwise the file goes. Waits for
-  // the keeper of an earlier service that is still at work. Our sessions have names that start with
-  // `ownSessions`, which is not empty.
+  // Takes over the daemon that the file names if it still runs; deletes the file otherwise. Waits
+  // for the keeper of an earlier service that is still at work. `ownSessions` is the prefix of our
+  // session names; it must not be empty, or sessions of others would match.
   void adopt(const std::string& ownSessions);
   [[nodiscard]] bool isNoted() const;
-  // Ends the daemon that was ours and does not answer any more, starts another and waits until it
-  // answers; or ends it and tells why not.
+  // Ends our daemon if it does not answer any more, starts another and waits until that answers. If
+  // it does not, ends it and returns why.
   [[nodiscard]] std::optional<std::string> start(const std::string& ownSessions);
   [[nodiscard]] bool isOurs() const { return process_.has_value(); }
-  // Ends the daemon, if it is ours, and waits until it is gone.
+  // Ends the daemon if it is ours, and waits until it has ended.
   void end();
-  // Has our sessions destroyed, and the daemon ended unless sessions of others are in it. Waits
-  // until that is done. The daemon is not ours any more.
+  // Lets the keeper destroy our sessions and, unless others use the daemon, end it. Waits until
+  // that is done. Afterwards the daemon is not ours.
   void leave();
 
  private:

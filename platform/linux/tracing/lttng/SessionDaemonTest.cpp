@@ -24,8 +24,8 @@ namespace fs = std::filesystem;
 
 constexpr const char* kOwnSessions = "halvox-test-";
 
-// From now on this process and what it starts do not see root's daemon. False when the system does
-// not permit that.
+// Hides root's daemon from this process and the programs that it starts. Returns false if the
+// system does not permit that.
 bool hideRootsDaemon() {
   static const bool isHidden = [] {
     const int user = ::geteuid() == 0 ? 0 : CLONE_NEWUSER;
@@ -36,7 +36,8 @@ bool hideRootsDaemon() {
   return isHidden;
 }
 
-// Scripts of a directory that is all of PATH take the daemon's place; no tracer is met.
+// Tests with scripts in the place of the daemon. PATH contains only their directory, so the tests
+// never meet a tracer.
 class SessionDaemonTest : public testing::Test {
  protected:
   void SetUp() override {
@@ -49,7 +50,7 @@ class SessionDaemonTest : public testing::Test {
   }
   ~SessionDaemonTest() override { ::setenv("PATH", path_.c_str(), 1); }
 
-  // The program notes its process and then does as told.
+  // The script notes its process and then does what `rest` says.
   void writeProgram(const std::string& rest) {
     const fs::path program = scratch_ / "lttng-sessiond";
     std::ofstream(program) << "#!/bin/sh\necho $$ >" << pidFile_.string() << "\n" << rest << "\n";
@@ -67,7 +68,7 @@ class SessionDaemonTest : public testing::Test {
     for (int number = 0; number < 22; ++number) file >> field;
     return field;
   }
-  // The keeper that was started last; 0 when none runs.
+  // The keeper that was started last; 0 if none runs.
   static pid_t keeper() {
     pid_t found = 0;
     for (const auto& entry : fs::directory_iterator("/proc")) {
@@ -87,7 +88,7 @@ class SessionDaemonTest : public testing::Test {
     std::ofstream(note_) << process << ' ' << startTimeOf(process) << '\n';
     daemon_.adopt(kOwnSessions);
   }
-  // A process of ours that waits to be ended.
+  // A process of ours that waits until it is ended.
   static pid_t startSleeper() {
     const pid_t child = ::fork();
     if (child == 0) {

@@ -6,11 +6,14 @@
 
 namespace halvox::platform::linux_ {
 
-// Packs the regular files of a directory into a tar archive (pax, compressed by zstd) of that path,
-// which has its name, mode 0600, when it is whole and on the disk. Until then it is beside the
-// directory, which must be in the same file system, and goes with it when the service is killed.
-// Blocks for the disk; needs the memory of one piece of a file. The failure in words; nothing is
-// then left of the archive.
+// Packs the regular files of a directory into a tar archive (pax, compressed with zstd).
+//
+// The archive appears under its name, with mode 0600, when it is complete and on the disk. Until
+// then it is a file beside the directory, which must be in the same file system. A service that is
+// killed leaves it there, where the next start deletes it.
+//
+// Blocks for the disk. Needs 64 KiB of memory and what the compression needs. Returns the failure
+// as a text; nothing is left of the archive then.
 [[nodiscard]] std::optional<std::string> packDirectory(const std::filesystem::path& directory,
                                                        const std::filesystem::path& archive);
 

@@ -22,13 +22,13 @@ class TraceArchiveTest : public testing::Test {
   TraceArchiveTest() {
     fs::create_directories(directory_);
     fs::create_directories(archives_);
-    // So little of it can be packed that it does not fit where the tests make it too large.
+    // Random digits compress little, so the archive does not fit where a test limits its size.
     std::ofstream file(directory_ / "stream");
     std::mt19937_64 random(1);
     for (int word = 0; word < 100'000; ++word) file << random();
   }
 
-  // No file of this process grows beyond that.
+  // No file of this process can grow beyond the limit.
   static void limitFiles() {
     const rlimit limit{.rlim_cur = 65'536, .rlim_max = 65'536};
     ::setrlimit(RLIMIT_FSIZE, &limit);

@@ -22,7 +22,7 @@ using Text = UniqueHandle<bt_value*, bt_value_put_ref>;
 constexpr std::string_view kEventName = "halvox:kdebug";
 constexpr std::uint64_t kNanosecondsPerSecond = 1'000'000'000;
 
-// The unsigned value of an integer field of either kind; 0 for none.
+// The value of an integer field, signed or unsigned; 0 for any other field.
 std::uint64_t number(const bt_field* field) {
   if (field == nullptr) return 0;
   const bt_field_class_type type = bt_field_get_class_type(field);
@@ -44,7 +44,8 @@ void copyText(const bt_field* field, std::array<char, 16>& text) {
   std::copy_n(value, ::strnlen(value, text.size() - 1), text.begin());
 }
 
-// The end of the graph: takes each message to the listener.
+// The end of the graph: passes each message to the listener. Lives on the stack of readTraces();
+// the library calls it on that thread.
 class Sink {
  public:
   Sink(const TraceListener& listener, TraceReading& reading)
@@ -58,7 +59,7 @@ class Sink {
         return count(bt_message_discarded_events_get_count, message, reading_.lost);
       case BT_MESSAGE_TYPE_DISCARDED_PACKETS:
         return count(bt_message_discarded_packets_get_count, message, reading_.lostPackets);
-      default:  // what begins and ends says nothing here
+      default:  // messages about the begin and end of streams and packets
         return;
     }
   }
@@ -68,7 +69,8 @@ class Sink {
     return BT_GRAPH_SIMPLE_SINK_COMPONENT_INITIALIZE_FUNC_STATUS_OK;
   }
 
-  // Of exceptions only those of a lack of memory can come from the listener.
+  // noexcept: the library is C and an exception must not cross it. Only a lack of memory could
+  // cause one.
   static bt_graph_simple_sink_component_consume_func_status consume(bt_message_iterator* iterator,
                                                                     void* sink) noexcept {
     using Status = bt_graph_simple_sink_component_consume_func_status;
@@ -90,12 +92,14 @@ class Sink {
   static void count(Get get, const bt_message* message, std::uint64_t& total) {
     std::uint64_t lost = 0;
     const bool isKnown = get(message, &lost) == BT_PROPERTY_AVAILABILITY_AVAILABLE;
+    // An unknown number counts as one, so that a loss never reads as none.
     total += isKnown ? lost : 1;
   }
 
   void takeEvent(const bt_message* message) {
     const bt_event* const event = bt_message_event_borrow_event_const(message);
     const char* const name = bt_event_class_get_name(bt_event_borrow_class_const(event));
+    // A channel may hold events of other providers.
     if (name == nullptr || kEventName != name) return;
     const bt_clock_snapshot* const clock =
         bt_message_event_borrow_default_clock_snapshot_const(message);
@@ -143,7 +147,7 @@ class Sink {
   bool wantsMore_ = true;
 };
 
-// What the library says about its latest failure, which it then forgets.
+// The cause of the library's latest error. The call clears it.
 std::string latestError() {
   const bt_error* const error = bt_current_thread_take_error();
   if (error == nullptr) return "unknown error";
@@ -155,7 +159,7 @@ std::string latestError() {
   return text;
 }
 
-// Where traces are: each has its metadata in its own directory.
+// The directories of traces: each has a file "metadata".
 std::vector<std::string> traceDirectories(const std::filesystem::path& root) {
   std::vector<std::string> directories;
   std::error_code error;
@@ -169,10 +173,11 @@ std::vector<std::string> traceDirectories(const std::filesystem::path& root) {
   return directories;
 }
 
-// Sources of traces, one for each directory, through one muxer into a sink.
+// Connects one source for each directory through a muxer, which orders the events by time, to a
+// sink. Used once, by one thread.
 class TraceGraph {
  public:
-  // True when it can run; the library has an error otherwise.
+  // True if the graph can run. Otherwise the library has an error.
   [[nodiscard]] bool build(const std::vector<std::string>& directories, Sink& sink) {
     graph_.reset(bt_graph_create(0));
     if (!graph_ || !find("ctf", ctf_) || !find("utils", utils_)) return false;
@@ -221,7 +226,7 @@ class TraceGraph {
     return true;
   }
 
-  // The muxer grows a free port whenever one is taken.
+  // The muxer adds a free port whenever one is connected.
   bool connect(const bt_port_output* port) {
     const std::uint64_t last = bt_component_filter_get_input_port_count(muxer_) - 1;
     const bt_port_input* const free =
@@ -252,6 +257,7 @@ class TraceGraph {
 
 }  // namespace
 
+// In integers where it can be: a double has 53 bits, and nanoseconds since 1970 need 61.
 std::uint64_t TraceClock::toNanoseconds(std::uint64_t ticks) const {
   const std::uint64_t sum = ticks + offsetTicks;
   const std::uint64_t seconds = sum / ticksPerSecond + static_cast<std::uint64_t>(offsetSeconds);

@@ -23,8 +23,9 @@ using std::chrono::milliseconds;
 using std::chrono::steady_clock;
 
 constexpr milliseconds kAnswersWithin{10'000};
-constexpr milliseconds kLookEvery{10};  // at a lock, whose end the system tells nobody
+constexpr milliseconds kLookEvery{10};  // flock() has no time-out
 
+// A build that is not installed has the keeper beside the service's program.
 std::string keeperPath() {
   const std::filesystem::path installed(HALVOX_TRACER_KEEPER);
   std::error_code error;
@@ -44,7 +45,8 @@ std::optional<Pipe> makePipe() {
   return Pipe{.reading = UniqueFd(ends[0]), .writing = UniqueFd(ends[1])};
 }
 
-// One line, without its end; empty when it does not come in time or the writer is gone.
+// Reads one line, without its end. Empty if it does not come in time or the writer has gone. Byte
+// by byte: the line is short, and nothing after it may be consumed.
 std::string readLine(int descriptor, milliseconds within) {
   const auto deadline = steady_clock::now() + within;
   std::string line;
@@ -85,6 +87,7 @@ std::optional<std::string> TracerKeeper::launch(const Ward& ward, DaemonProcess&
     return failed + errnoText(error);
   }
   whileWeLive_ = std::move(life->writing);
+  // Our copy of the writing end must go, or the end of the keeper would not end the reading.
   answer->writing.reset();
   const std::string line = readLine(answer->reading.get(), kAnswersWithin);
   const std::string_view text = line;

@@ -12,19 +12,23 @@
 
 namespace halvox::platform::linux_ {
 
-// The program `halvox-tracer-keeper`, which outlives the service by the moments that it takes to
-// end the tracer's daemon: however the service ends, the end of their pipe tells the keeper. It
-// then destroys the service's sessions, and ends the daemon unless sessions of others are in it.
+// Starts and releases the program `halvox-tracer-keeper`, which ends the tracer's daemon when the
+// service has ended.
 //
 //   none --start() or keep()--> keeping --release()--> none
 //
-// The note file names the daemon, and its keeper holds a lock on it. Belongs to one thread at a
-// time.
+// However the service ends, the kernel closes its end of a pipe, and the keeper sees that. It then
+// destroys the service's sessions and ends the daemon unless others have sessions in it.
+// PR_SET_PDEATHSIG would be simpler, but it depends on the thread that forked and cannot ask
+// whether others use the daemon.
+//
+// The note file names the daemon, and its keeper holds a lock on the file. Belongs to one thread at
+// a time; SessionDaemon owns it. A keeper that cannot be started is a text for the log.
 class TracerKeeper {
  public:
   struct Ward {
     std::filesystem::path noteFile{};
-    std::string ownSessions{};  // how the names of the service's sessions start
+    std::string ownSessions{};  // the prefix of the service's session names
   };
 
   TracerKeeper() = default;
@@ -32,22 +36,23 @@ class TracerKeeper {
   TracerKeeper& operator=(const TracerKeeper&) = delete;
   ~TracerKeeper() { release(); }
 
-  // Starts a keeper, which starts a daemon; or tells why there is none. Waits until the daemon is
-  // started, but not until it answers.
+  // Starts a keeper, which starts a daemon. Returns why there is none, if there is none. Waits
+  // until the daemon has been started, but not until it answers.
   [[nodiscard]] std::optional<std::string> start(const Ward& ward, DaemonProcess& daemon);
-  // Starts a keeper of a daemon that runs already, or tells why there is none.
+  // Starts a keeper for a daemon that runs already. Returns why there is none, if there is none.
   [[nodiscard]] std::optional<std::string> keep(const Ward& ward, const DaemonProcess& daemon);
   // Waits at most that time until no keeper, of an earlier service, holds the note any more.
+  // Waits until no keeper of an earlier service holds the note, at most `within`.
   static void awaitEarlier(const std::filesystem::path& noteFile, std::chrono::milliseconds within);
-  // Has the keeper do what it does at the end of the service, and waits until it has. False when
-  // there is none, or when it was killed.
+  // Lets the keeper do its work as at the end of the service, and waits until it has ended. Returns
+  // false if there is no keeper or it was killed.
   bool release();
 
  private:
   [[nodiscard]] std::optional<std::string> launch(const Ward& ward, DaemonProcess& daemon);
 
   pid_t pid_ = 0;
-  UniqueFd whileWeLive_;  // the keeper sees its end
+  UniqueFd whileWeLive_;  // the keeper sees when this is closed
 };
 
 }  // namespace halvox::platform::linux_

@@ -1,12 +1,14 @@
 // halvox-tracer-keeper NOTE SESSIONS [PID STARTTIME]
 //
-// Keeps a session daemon of LTTng for as long as standard input stays open, that is as long as the
-// service lives that started the keeper. The daemon is the one of the process that is named, else
-// one that the keeper starts. It is named in the file NOTE and, in the same form, on standard
-// output; or there is one line on standard output that says why there is none, and exit status 1.
+// Keeps a session daemon of LTTng as long as standard input stays open, which is as long as the
+// service that started the keeper lives. If PID and STARTTIME name a process, that is the daemon;
+// otherwise the keeper starts one.
 //
-// At the end of input, whatever brought it about, the sessions whose names start with SESSIONS are
-// destroyed. The daemon is then ended, unless sessions of others are in it.
+// It notes the daemon in the file NOTE and prints the same line on standard output. If there is no
+// daemon, it prints a line with the reason and exits with status 1.
+//
+// At the end of input it destroys the sessions whose names begin with SESSIONS. Then it ends the
+// daemon, unless others have sessions in it.
 
 #include <algorithm>
 #include <cerrno>
@@ -35,12 +37,13 @@ namespace {
 using namespace halvox::platform::linux_;
 
 constexpr unsigned kSecondsToAnswer = 10;
-constexpr std::chrono::seconds kEndsWithin{5};  // of a signal; then it is killed
+constexpr std::chrono::seconds kEndsWithin{5};  // after SIGTERM; then it is killed
 
-volatile std::sig_atomic_t silentDaemon = 0;  // while it is asked
+volatile std::sig_atomic_t silentDaemon = 0;  // the daemon that is being asked; 0: none
 
-// The library waits for a daemon without end. One that hangs serves nobody, so it is killed, which
-// ends the wait too, unless it is another daemon that was asked.
+// The library waits for a daemon without limit. A daemon that hangs serves nobody, so it is killed,
+// which also ends the wait. If the wait goes on, another daemon was asked: the second alarm then
+// ends the keeper.
 void onSilence(int /*signal*/) {
   const pid_t daemon = silentDaemon;
   if (daemon == 0) ::_exit(EXIT_FAILURE);
@@ -51,7 +54,7 @@ void onSilence(int /*signal*/) {
 
 void say(const std::string& line) {
   const std::string text = line + "\n";
-  // A service that is gone already needs no answer; what follows then is its end.
+  // A service that has gone needs no answer. The keeper goes on to clean up after it.
   if (::write(STDOUT_FILENO, text.data(), text.size()) < 0) return;
 }
 
@@ -72,7 +75,7 @@ std::optional<DaemonProcess> startDaemon(std::string& failure) {
   return DaemonProcess::withNumber(pid);
 }
 
-// Whether the daemon has sessions that are not the service's. Leaves none that are.
+// Destroys the service's sessions. Returns whether the daemon has sessions of others.
 bool isUsedByOthers(const DaemonProcess& daemon, std::string_view ownSessions) {
   silentDaemon = daemon.pid;
   std::signal(SIGALRM, onSilence);
@@ -80,14 +83,14 @@ bool isUsedByOthers(const DaemonProcess& daemon, std::string_view ownSessions) {
   destroyTracerSessions(ownSessions);
   const std::vector<std::string> left = tracerSessionNames();
   ::alarm(0);
-  // A session that is being destroyed may still be listed.
+  // One of our sessions that is being destroyed may still be listed.
   return std::ranges::any_of(
       left, [&](const std::string& name) { return !name.starts_with(ownSessions); });
 }
 
 int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
          std::optional<DaemonProcess> daemon) {
-  // The lock is the keeper's: the daemon and what it starts do not get the descriptor.
+  // The keeper alone holds the lock: the descriptor is not inherited by the daemon.
   const UniqueFd note(::open(noteFile.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644));
   if (!note || ::flock(note.get(), LOCK_EX) != 0) {
     say("cannot lock " + noteFile.string() + ": " + errnoText(errno));
@@ -101,8 +104,7 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
     say(failure);
     return EXIT_FAILURE;
   }
-  // A note that cannot be written is missed only by a service that starts after a keeper was
-  // killed.
+  // If the note cannot be written, only a service that starts after a killed keeper misses it.
   static_cast<void>(daemon->write(noteFile));
   say(std::to_string(daemon->pid) + " " + daemon->startTime);
   awaitEndOfService();

@@ -6,12 +6,12 @@
 
 namespace halvox::platform::linux_ {
 
-// The names of all sessions that the tracer's daemon has; none when no daemon answers. Waits for
-// the daemon, without end if it hangs. The control library is not for several threads at once.
+// The names of all sessions in the tracer's daemon; none if no daemon answers. Blocks without limit
+// if the daemon hangs. The control library is not thread-safe: one thread at a time.
 [[nodiscard]] std::vector<std::string> tracerSessionNames();
 
-// Destroys the sessions whose names start so, without waiting for what they recorded. An empty
-// prefix names none: those of others are never touched.
+// Destroys the sessions whose names begin with the prefix, without waiting for their data. An empty
+// prefix matches none: sessions of others are never touched.
 void destroyTracerSessions(std::string_view prefix);
 
 }  // namespace halvox::platform::linux_
