@@ -11,7 +11,8 @@ namespace halvox::platform::linux_ {
 std::variant<std::unique_ptr<KdebugService>, std::string> LttngKdebugService::load(
     const std::filesystem::path& module) {
   if (module.empty()) return "this build has no LTTng provider";
-  // Otherwise a session daemon that does not answer would hold up the start for three seconds.
+  // LTTng would otherwise wait three seconds at the start for a session daemon that does not
+  // answer.
   ::setenv("LTTNG_UST_REGISTER_TIMEOUT", "0", /*replace=*/0);
   void* const library = ::dlopen(module.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
   if (library == nullptr) return ::dlerror();

@@ -10,7 +10,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Trace points that go nowhere.
+// Discards trace points. For a build or a machine without LTTng. Any thread may call.
 class NoKdebugService final : public KdebugService {
  public:
   void kdebug_trace(std::uint32_t /*code*/, std::uint64_t /*argument1*/,
@@ -18,20 +18,24 @@ class NoKdebugService final : public KdebugService {
                     std::uint64_t /*argument4*/) override {}
 };
 
-// Trace points as LTTng events "halvox:kdebug" with the fields code and arg1 to arg4.
+// Emits trace points as LTTng events "halvox:kdebug" with the fields code and arg1 to arg4.
 //
-// The provider is a module that is loaded here. LTTng then has two threads in the process, which
-// sleep until a session daemon starts: they cost no wake-up, and a daemon that starts later finds
-// the service too. Loading does not wait for a daemon, not even for one that hangs.
-// The module stays loaded to the end of the process, as its threads need it.
+// The LTTng provider is a module that is loaded at run time. LTTng then has two threads in the
+// process. They sleep until a session daemon starts, so they cost no wake-up, and a daemon that
+// starts later finds the service too. Loading does not wait for a daemon, not even for one that
+// hangs.
+//
+// Any thread may call. The platform owns it. The module stays loaded until the process ends,
+// because LTTng's threads need it. If it cannot be loaded, the platform logs that and uses
+// NoKdebugService.
 class LttngKdebugService final : public KdebugService {
  public:
-  // The service, or in words why the provider cannot be loaded. Call it before other threads start:
-  // it may set an environment variable.
+  // The service, or a text with the reason why the provider cannot be loaded. Call it before other
+  // threads start: it may set an environment variable, which is not thread-safe.
   static std::variant<std::unique_ptr<KdebugService>, std::string> load(
       const std::filesystem::path& module);
-  // Where the provider is: beside the program, else where it is installed. Empty when this build
-  // has none.
+  // The path of the provider: beside the program if it is there, else the installed one. Empty if
+  // this build has none.
   static std::filesystem::path modulePath();
 
   void kdebug_trace(std::uint32_t code, std::uint64_t argument1, std::uint64_t argument2,

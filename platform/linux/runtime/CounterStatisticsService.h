@@ -12,7 +12,7 @@
 
 namespace halvox::platform::linux_ {
 
-// One counter as it stood when it was read.
+// One counter with its value when it was read.
 struct CounterReading {
   std::string piece;
   std::string name;
@@ -20,21 +20,21 @@ struct CounterReading {
   friend bool operator==(const CounterReading&, const CounterReading&) = default;
 };
 
-// The service's counters, by piece and name. Any thread may call.
-// Owns the counters; they live as long as it does.
+// Owns the service's counters, by piece and name. They live as long as it does. Any thread may
+// call; finding a counter takes a lock, adding to one does not.
 class CounterStatisticsService final : public StatisticsService {
  public:
   Counter& counter(std::string_view piece, std::string_view name) override;
 
-  // All counters in the order of piece and name. Each is read on its own, so sums agree only once
-  // the threads that count stand still.
+  // All counters in the order of piece and name. Each is read by itself, so sums agree only after
+  // the threads that count have stopped.
   [[nodiscard]] std::vector<CounterReading> snapshot() const;
 
  private:
   using CountersOfPiece = std::map<std::string, Counter, std::less<>>;
 
   mutable Mutex mutex_;
-  // Maps keep their elements in place, so handed-out counters stay where they are.
+  // Elements of a map do not move, so references to counters stay valid.
   std::map<std::string, CountersOfPiece, std::less<>> counters_ HALVOX_GUARDED_BY(mutex_);
 };
 

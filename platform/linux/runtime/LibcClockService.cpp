@@ -23,9 +23,9 @@ std::chrono::nanoseconds read(clockid_t clock) {
   return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
 
-// The start time in the text of /proc/self/stat, in clock ticks since the system started.
+// The start time in the text of /proc/self/stat, in clock ticks after the start of the system.
 std::optional<std::int64_t> startTicks(std::string_view stat) {
-  // The command name, second of the fields, may hold blanks and parentheses: count from its end.
+  // The command name may contain spaces and parentheses, so the fields are counted from its end.
   constexpr int kFieldsAfterName = 20;  // the start time is field 22
   const std::size_t end = stat.rfind(')');
   if (end == std::string_view::npos) return std::nullopt;
@@ -64,7 +64,7 @@ Date LibcClockService::currentDate() const {
 }
 
 LocalTime LibcClockService::localTime(Date date) const {
-  constexpr double kFarthest = 1e15;  // some 31 million years, which time_t and tm still hold
+  constexpr double kFarthest = 1e15;  // some 31 million years, which time_t and tm can represent
   if (!(std::abs(date.secondsSince1970) <= kFarthest)) return {};
   const auto time = static_cast<std::time_t>(std::floor(date.secondsSince1970));
   std::tm local{};

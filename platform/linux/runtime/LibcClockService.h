@@ -6,8 +6,10 @@
 
 namespace halvox::platform::linux_ {
 
-// The clocks of the C library. Uptimes count while the machine sleeps too.
-// Make it early: where the kernel does not tell when the process started, that moment counts.
+// The clocks of the C library. Uptimes include the time in which the machine was suspended.
+//
+// Any thread may call; nothing fails. The platform owns it, and makes it early: if the kernel does
+// not tell when the process started, processUptime() counts from the constructor.
 class LibcClockService final : public ClockService {
  public:
   LibcClockService();
@@ -18,7 +20,7 @@ class LibcClockService final : public ClockService {
   [[nodiscard]] std::chrono::milliseconds processUptime() const override;
 
  private:
-  const std::chrono::nanoseconds processStart_;  // since the system started
+  const std::chrono::nanoseconds processStart_;  // after the start of the system
 };
 
 }  // namespace halvox::platform::linux_

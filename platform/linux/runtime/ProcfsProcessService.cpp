@@ -15,8 +15,8 @@ namespace {
 
 constexpr std::size_t kLongestName = 15;
 
-// The name in that `comm` file: all of it but the newline that the kernel adds. A name may hold
-// anything but NUL, newlines and parentheses included.
+// The name in a `comm` file: everything except the newline that the kernel appends. A name may
+// contain any character but NUL, newlines and parentheses included.
 std::optional<std::string> readCommandName(const std::string& path) {
   const UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
   if (!file) return std::nullopt;

@@ -9,19 +9,21 @@
 
 namespace halvox::platform::linux_ {
 
-// Processes as /proc shows them. Any thread may ask. A name comes from the kernel, which cuts it to
-// 15 bytes, maybe within a character; what is then not UTF-8 becomes U+FFFD.
-// A record that cannot be read, for whatever reason, is no record.
+// Processes as /proc shows them.
+//
+// A name comes from the kernel, which cuts it to 15 bytes, perhaps within a character; bytes that
+// are not UTF-8 become U+FFFD. A record that cannot be read, for whatever reason, counts as no
+// record. Any thread may call. The platform owns it.
 class ProcfsProcessService final : public ProcessService {
  public:
-  // `beforeEnd` is called by terminate(), to write what was logged before the end. It must be
-  // quick.
+  // terminate() calls `beforeEnd`, which writes the log lines that are still queued. It must be
+  // quick: the process is to end at once.
   explicit ProcfsProcessService(std::function<void()> beforeEnd = {})
       : beforeEnd_(std::move(beforeEnd)) {}
 
   [[nodiscard]] std::optional<ProcessRecord> processRecord(ProcessID pid) const override;
   [[nodiscard]] ProcessID ownProcessIdentifier() const override;
-  // The name that the process was called by, without its folder; not cut to 15 bytes.
+  // The name that the process was started with, without its directory; not cut to 15 bytes.
   [[nodiscard]] std::string ownProcessName() const override;
   [[noreturn]] void terminate(int exitStatus) override;
 

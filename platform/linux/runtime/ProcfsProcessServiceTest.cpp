@@ -10,7 +10,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The test process under another name, for a scope.
+// Gives the test process another name for a scope.
 class OwnName {
  public:
   explicit OwnName(const char* name) {
@@ -37,7 +37,7 @@ TEST(ProcfsProcessServiceTest, NameMayHoldNewlines) {
 }
 
 TEST(ProcfsProcessServiceTest, BytesThatAreNoCharactersAreReplaced) {
-  // The kernel cuts in the middle of the last character.
+  // The kernel cuts the name within its last character.
   const OwnName name("fourteen-bytesé");
 
   EXPECT_EQ(recordedOwnName(), "fourteen-bytes\uFFFD");

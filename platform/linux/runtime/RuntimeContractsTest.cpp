@@ -1,4 +1,4 @@
-// The contracts of the ports, kept by the adapters of this folder.
+// The contracts of the ports, run on the adapters of this folder.
 
 #include <array>
 #include <chrono>
@@ -34,7 +34,7 @@ class LibcClockHarness {
   linux_::LibcClockService service_;
 };
 
-// Children that do nothing but bear the names that they are told.
+// Child processes that do nothing but have a name.
 class ProcfsHarness {
  public:
   ProcessService& service() { return service_; }

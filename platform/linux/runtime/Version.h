@@ -2,7 +2,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The version that the service and its tools are of, such as "1.2.3".
+// The version of the service and its tools, such as "1.2.3". Both use this, so that they agree.
 [[nodiscard]] const char* halvoxVersion();
 
 }  // namespace halvox::platform::linux_

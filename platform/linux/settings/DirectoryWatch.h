@@ -15,14 +15,14 @@
 
 namespace halvox::platform::linux_ {
 
-// Watches the files in some directories by means of inotify. A directory need not exist: then the
-// watch waits for it to appear. Uses no timer.
+// Watches the files in some directories with inotify. A directory need not exist: the watch then
+// waits until it appears. Uses no timer, so that an idle service makes no wake-ups.
 //
-//   made --arm()--> armed --(a directory appeared, vanished or was moved; events were lost)-->
-//   arm()
+//   made --arm()--> armed --(a directory appeared, disappeared or was moved; events were lost)-->
+//   must be armed again --arm()--> armed
 //
-// Belongs to one thread and one owner. When a directory cannot be watched, arm() returns the error
-// and the other directories are watched all the same.
+// Belongs to one thread and one owner. If a directory cannot be watched, arm() returns the error
+// and still watches the other directories.
 class DirectoryWatch {
  public:
   // Whether the file exists after the change.

@@ -1,4 +1,4 @@
-// The contract of notifications, kept by the adapter.
+// The contract of notifications, run on the adapter.
 
 #include "platform/fake/contracts/NotifyContract.h"
 

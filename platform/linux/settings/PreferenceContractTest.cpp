@@ -1,4 +1,4 @@
-// The contract of preferences, kept by the adapter.
+// The contract of preferences, run on the adapter.
 
 #include "platform/fake/contracts/PreferenceContract.h"
 

@@ -11,9 +11,11 @@
 namespace halvox::platform::linux_ {
 
 // Changes single preferences in the text of a file and keeps everything else as it is: comments,
-// order and spacing. Refuses a change that would need more than the lines of its key. Parses every
-// result again and returns it only when it has the intended values. Pure functions: any thread may
-// call.
+// order and spacing. People edit these files too.
+//
+// Refuses a change that would need more than the lines of its key. Parses every result again and
+// returns it only if it has the intended values, because a text edit can go wrong in ways that a
+// parser cannot. Pure functions: any thread may call.
 
 // A value as TOML text, and its meaning.
 struct PreferenceValue {

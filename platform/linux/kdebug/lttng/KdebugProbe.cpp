@@ -1,5 +1,5 @@
 // Emits one trace point for each line on standard input, for the tests of the tracepoint provider.
-// Says "ready" once the provider is loaded.
+// Prints "ready" when the provider is loaded.
 
 #include <iostream>
 #include <memory>

@@ -1,5 +1,5 @@
-// The module that holds the tracepoint provider, apart from the service: loading LTTng starts its
-// listener threads, and that is for the service to decide.
+// The tracepoint provider as a module of its own: loading LTTng starts its listener threads, and
+// the service decides whether it does that.
 
 #define LTTNG_UST_TRACEPOINT_CREATE_PROBES
 #define LTTNG_UST_TRACEPOINT_DEFINE
