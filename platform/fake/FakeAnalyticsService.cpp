@@ -29,14 +29,14 @@ void FakeAnalyticsService::buildPayloads() const {
       builder = std::exchange(records_[index].builder, nullptr);
     }
     if (!builder) continue;
-    Dictionary payload = builder();  // without the lock: a builder may call anything
+    Dictionary payload = builder();  // without the lock: a builder may call this service
     const std::lock_guard lock(mutex_);
     if (index < records_.size()) records_[index].event.payload = std::move(payload);
   }
 }
 
 void FakeAnalyticsService::clear() {
-  std::vector<Record> dropped;  // destroyed without the lock: builders own sessions
+  std::vector<Record> dropped;  // destroyed without the lock: builders may own sessions
   const std::lock_guard lock(mutex_);
   dropped.swap(records_);
   tested_.clear();

@@ -12,29 +12,33 @@
 
 namespace halvox::platform {
 
-// An analytics service that keeps what it was sent. At first every name is wanted. A payload is
-// never built by the sender, but later: when the test reads the events or, if it says so,
-// only when told. Any thread may call; the test reads from its own.
+// Keeps the events that it was sent. At first it wants every name.
+//
+// The sender never builds a payload. That happens later, as in the store: when the test reads the
+// events, or only when the test asks for it. A test that reads a payload at once would otherwise
+// hide a builder with a dangling reference.
+//
+// Any thread may call; the test reads on its own. FakePlatform owns it.
 class FakeAnalyticsService final : public AnalyticsService {
  public:
-  // kWhenSent: on another thread, as by a store whose writer is faster than the sender.
+  // kWhenSent: on another thread at once, as by a store whose writer is faster than the sender.
   enum class Building : unsigned char { kWhenRead, kWhenTold, kWhenSent };
   struct Event {
     std::string name;
-    std::optional<Dictionary> payload;  // none until it was built
+    std::optional<Dictionary> payload;  // none until it has been built
   };
 
   // Does not own the journal, which must outlive it.
   explicit FakeAnalyticsService(Journal& journal) : journal_(journal) {}
 
   void wantEverything();
-  // From now on only these names are wanted; none at all with an empty set.
+  // From now on only these names are wanted; with an empty set none is.
   void wantOnly(std::set<std::string, std::less<>> names);
   void setBuilding(Building building);
-  // Builds the payloads that are not built yet, in the order of their sending, on this thread; lets
-  // go of their builders.
+  // Builds the payloads that have not been built, in the order of sending, on this thread. Releases
+  // their builders.
   void buildPayloads() const;
-  // Forgets what was asked, sent and not built yet.
+  // Forgets all questions and events, also those whose payloads have not been built.
   void clear();
 
   [[nodiscard]] std::vector<Event> events() const;
@@ -49,7 +53,7 @@ class FakeAnalyticsService final : public AnalyticsService {
  private:
   struct Record {
     Event event;
-    AnalyticsPayloadBuilder builder;  // empty once the payload is built
+    AnalyticsPayloadBuilder builder;  // empty when the payload has been built
   };
 
   [[nodiscard]] bool buildsWhenRead() const;

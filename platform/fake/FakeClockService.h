@@ -8,7 +8,8 @@
 namespace halvox::platform {
 
 // Clocks that stand still until the test moves them. They start at round numbers that differ from
-// each other, so that mixing them up shows. Any thread may ask.
+// each other, so that a test notices when code uses the wrong one. Any thread may call.
+// FakePlatform owns it.
 class FakeClockService final : public ClockService {
  public:
   // Sets the wall clock, which may go back.
@@ -17,7 +18,7 @@ class FakeClockService final : public ClockService {
   void setProcessUptime(std::chrono::milliseconds uptime);
   // Sets the time zone, which is UTC at first.
   void setOffsetFromUTC(std::chrono::minutes offset);
-  // Moves all three on.
+  // Moves all three clocks forward.
   void advance(std::chrono::nanoseconds by);
 
   [[nodiscard]] Date currentDate() const override;

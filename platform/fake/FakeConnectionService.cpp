@@ -7,7 +7,7 @@
 namespace halvox::platform {
 namespace {
 
-// What is being delivered on this thread.
+// The connection and request that are being delivered on this thread.
 thread_local const NSXPCConnection* deliveringConnection = nullptr;
 thread_local RequestToken deliveringRequest;
 
@@ -28,7 +28,7 @@ class DeliveryMark {
   RequestToken outerRequest_;
 };
 
-// Reads one complete type of a D-Bus signature; the position behind it.
+// Skips one complete type of a D-Bus signature. Returns the position after it.
 std::size_t skipType(std::string_view signature, std::size_t position) {
   if (signature.at(position) == 'a') return skipType(signature, position + 1);
   int depth = 0;

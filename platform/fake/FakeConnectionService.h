@@ -12,8 +12,8 @@
 
 namespace halvox::platform {
 
-// One request of a fake client and the answers that it got. Shared by the test and the reply
-// callback. Unlike the wire it has room for any number of answers, so that tests can count them.
+// One request of a fake client and its answers. Shared by the test and the reply callback; any
+// thread may answer. Unlike the wire it keeps any number of answers, so that a test can count them.
 class FakeCall {
  public:
   struct Reply {
@@ -26,7 +26,7 @@ class FakeCall {
 
   [[nodiscard]] std::vector<Reply> replies() const;
   [[nodiscard]] bool isAnswered() const { return !replies().empty(); }
-  // The value of the only answer; throws when there is none, several, or an error.
+  // The value of the only answer. Throws if there is none, more than one, or an error.
   [[nodiscard]] Value value() const;
   void add(const std::optional<Error>& error, const Value& value);
 
@@ -39,30 +39,30 @@ class FakeCall {
 
 class FakeConnectionService;
 
-// Whose process a fake client is: the service's own user's or root's, or another's.
+// The user of a fake client's process: root or the service's own user, or another.
 enum class FakeUser : unsigned char { kOwner, kStranger };
 
-// A client's connection that the test plays: it sends requests, is interrupted and goes away.
-// All on the thread of the test, which stands for the connection's thread. Held by the service
-// until it is invalidated, and by the test.
+// A client's connection in the hands of the test, which sends requests, interrupts and disconnects.
+// Everything runs on the test's thread, which stands for the connection's thread. Shared by the
+// test and, until it is invalidated, by the service.
 class FakeConnection final : public NSXPCConnection {
  public:
-  static constexpr std::size_t kMaxReporterIDs = 10'000;  // of one request, as by default
+  static constexpr std::size_t kMaxReporterIDs = 10'000;  // for one request; the default limit
 
   FakeConnection(Journal& journal, ProcessID pid, FakeUser user = FakeUser::kOwner)
       : journal_(journal), pid_(pid), user_(user) {}
 
-  // Delivers a request to the exported object and returns it with the answers so far; later answers
-  // are added to it. A request for the owner is refused to a stranger. Throws when the connection
-  // was not resumed, has ended, has no such method, or when the number of arguments is not that of
-  // the method's signature.
+  // Delivers a request to the exported object. Returns it with the answers so far; later answers
+  // are added to it. A request that is for the owner is refused to a stranger. Throws if the
+  // connection was not resumed or has ended, if it has no such method, or if the number of
+  // arguments is not that of the method's signature.
   std::shared_ptr<FakeCall> call(std::string_view method, std::vector<Value> arguments = {});
-  // The other end is gone though the connection might come back.
+  // The other end has gone, but the connection might come back.
   void interrupt();
-  // The connection has ended for good: calls the handler once, then lets go of the exported object.
+  // The connection has ended for good: calls the handler once, then releases the exported object.
   void invalidate();
 
-  // How many requests are still being carried out.
+  // The number of requests that have not been carried out.
   [[nodiscard]] std::size_t openRequests() const;
   [[nodiscard]] bool isResumed() const { return resumed_; }
   [[nodiscard]] bool isAccepted() const { return accepted_; }
@@ -80,7 +80,7 @@ class FakeConnection final : public NSXPCConnection {
  private:
   friend class FakeConnectionService;
 
-  // Lets go of everything without calling a handler.
+  // Releases everything without calling a handler.
   void abandon();
 
   Journal& journal_;
@@ -93,17 +93,17 @@ class FakeConnection final : public NSXPCConnection {
   std::shared_ptr<ExportedObject> object_;
   std::function<void()> interruptionHandler_;
   std::function<void()> invalidationHandler_;
-  std::shared_ptr<int> openRequests_ = std::make_shared<int>();  // one more owner per open request
+  std::shared_ptr<int> openRequests_ = std::make_shared<int>();  // each open request holds a copy
 };
 
-// A listener that accepts nothing by itself.
+// A listener that accepts connections only when the test makes them.
 class FakeListener final : public NSXPCListener {
  public:
   [[nodiscard]] NSXPCListenerDelegate* delegate() const { return delegate_; }
   [[nodiscard]] bool isResumed() const { return resumed_; }
 
   void setDelegate(NSXPCListenerDelegate& delegate) override { delegate_ = &delegate; }
-  // Returns at once, unlike a real one.
+  // Returns at once, unlike a real listener, which serves until the process ends.
   void resume() override { resumed_ = true; }
 
  private:
@@ -111,17 +111,17 @@ class FakeListener final : public NSXPCListener {
   bool resumed_ = false;
 };
 
-// Connections that the test makes.
+// Connections that the test makes. FakePlatform owns it; used on the test's thread.
 class FakeConnectionService final : public ConnectionService {
  public:
   // Does not own the journal, which must outlive it.
   explicit FakeConnectionService(Journal& journal) : journal_(journal) {}
 
-  // A new client of that process: shows the connection to the listener's delegate and returns it
-  // whether it was accepted or not; one that was not has ended. Throws when the listener has no
-  // delegate.
+  // Connects a new client of that process: passes the connection to the listener's delegate and
+  // returns it, accepted or not. A connection that was not accepted has ended. Throws if the
+  // listener has no delegate.
   std::shared_ptr<FakeConnection> connect(ProcessID pid, FakeUser user = FakeUser::kOwner);
-  // Lets go of all connections without calling their handlers.
+  // Releases all connections without calling their handlers.
   void clear();
 
   [[nodiscard]] FakeListener& serviceListener() override { return listener_; }

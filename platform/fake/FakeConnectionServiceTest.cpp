@@ -11,7 +11,7 @@
 namespace halvox::platform {
 namespace {
 
-// What a request saw and was given; the last reply is kept when it is not answered at once.
+// Keeps what a request contained, and the reply if it is not answered at once.
 struct Recorder final : ExportedObject {
   explicit Recorder(FakeConnectionService& service) : connections(service) {}
   FakeConnectionService& connections;

@@ -9,8 +9,8 @@
 
 namespace halvox::platform {
 
-// Device properties that the test sets; none at first. Counts how often it is asked. Any thread may
-// ask.
+// Device properties that the test sets; none at first. Counts the look-ups, because the service may
+// make only one for each process. Any thread may call. FakePlatform owns it.
 class FakeDevicePropertyService final : public DevicePropertyService {
  public:
   void set(std::string_view key, const Value& value);

@@ -13,12 +13,12 @@
 
 namespace halvox::platform {
 
-// A bug-capture service that captures nothing: it keeps what its reporters were asked for, and the
-// test gives the replies. Any thread may call; the test calls from its own.
+// A bug-capture service that captures nothing. It keeps the requests of its reporters, and the test
+// gives the replies. Any thread may call; the test calls on its own. FakePlatform owns it.
 class FakeDiagnosticReporterService final : public DiagnosticReporterService {
  public:
   struct Request {
-    const AILDiagnosticReporter* reporter;  // only to be compared; it may be gone
+    const AILDiagnosticReporter* reporter;  // for comparing only; it may have been destroyed
     Dictionary signature;
     double durationSeconds;
     std::optional<Dictionary> event;
@@ -29,17 +29,17 @@ class FakeDiagnosticReporterService final : public DiagnosticReporterService {
   explicit FakeDiagnosticReporterService(Journal& journal);
   ~FakeDiagnosticReporterService() override;
 
-  // How many reporters were made.
+  // The number of reporters that were made.
   [[nodiscard]] std::size_t reportersMade() const;
-  // The snapshots that were asked for, in order, answered or not.
+  // All requests in order, answered or not.
   [[nodiscard]] std::vector<Request> requests() const;
-  // Gives the reply to the request of that index, on this thread; throws when there is none, or
-  // when it has been given.
+  // Gives the reply to the request of that index, on this thread. Throws if there is no such
+  // request or it has its reply.
   void reply(std::size_t index, const Dictionary& response);
-  // The state of the service, as the source that was set gives it; none when no source was set or
-  // when it did not answer before it returned.
+  // The state of the service from the source that was set; none if there is no source, or if it did
+  // not answer before it returned.
   [[nodiscard]] std::optional<Dictionary> state() const;
-  // The same for a source that answers later; nothing happens when no source was set.
+  // The same for a source that answers later. Does nothing without a source.
   void askState(std::function<void(const Dictionary& state)> callback) const;
 
   [[nodiscard]] std::shared_ptr<AILDiagnosticReporter> createReporter() override;
@@ -52,7 +52,7 @@ class FakeDiagnosticReporterService final : public DiagnosticReporterService {
   mutable std::mutex mutex_;
   std::size_t made_ = 0;
   StateSource stateSource_;
-  // Shared with the reporters, which may live longer.
+  // Shared with the reporters, which may outlive the service.
   std::shared_ptr<Requests> requests_;
 };
 

@@ -7,15 +7,15 @@
 namespace halvox::platform {
 namespace {
 
-// What this thread is running: whether a job at all, and of which queue (null: of the background
-// queue).
+// What this thread is running: whether it runs a job, and of which queue; null for the background
+// queue.
 thread_local bool runningJob = false;
 thread_local FakeDispatchQueue* runningQueue = nullptr;
 
 class RunningMark {
  public:
   explicit RunningMark(FakeDispatchQueue* queue) {
-    // Pumping inside a job would run a queue's jobs inside each other, which no real queue does.
+    // Running jobs inside a job would nest jobs of one queue, which no real queue does.
     if (runningJob) throw std::logic_error("a job of the fake dispatch service pumped it");
     runningJob = true;
     runningQueue = queue;
@@ -28,7 +28,7 @@ class RunningMark {
   }
 };
 
-// While a job stands still, others may run on its thread.
+// While a job waits, others may run on its thread.
 class StandingMark {
  public:
   StandingMark() : wasRunning_(std::exchange(runningJob, false)), queue_(runningQueue) {
@@ -97,7 +97,7 @@ bool FakeDispatchService::runOne() {
   }
   const RunningMark mark(next.queue.get());
   next.job();
-  next.job = nullptr;  // what the job held goes while it still counts as running
+  next.job = nullptr;  // what the job holds is released while the job counts as running
   return true;
 }
 
@@ -108,7 +108,7 @@ void FakeDispatchService::advance(std::chrono::nanoseconds by) {
   moveTimeTo(until);
 }
 
-// Goes on to the next delayed job or end of a wait; false when there is none up to that time.
+// Moves to the next delayed job or end of a wait. Returns false if there is none up to that time.
 bool FakeDispatchService::passNext(std::chrono::nanoseconds until) {
   std::chrono::nanoseconds time{};
   Job job;
@@ -152,7 +152,7 @@ FakeDispatchService::Waits::iterator FakeDispatchService::firstToTimeOut() {
 void FakeDispatchService::runDelayed(Job job) {
   const RunningMark mark(nullptr);
   job();
-  job = nullptr;  // what the job held goes while it still counts as running
+  job = nullptr;  // what the job holds is released while the job counts as running
 }
 
 void FakeDispatchService::moveTimeTo(std::chrono::nanoseconds time) {

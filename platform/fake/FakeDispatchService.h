@@ -20,7 +20,8 @@ namespace halvox::platform {
 
 class FakeDispatchService;
 
-// A serial queue whose jobs wait until the test pumps the service that made it.
+// A serial queue. Its jobs wait until the test runs them through the service that made it. Shared
+// by its users and its jobs; must not outlive the service.
 class FakeDispatchQueue final : public DispatchQueue,
                                 public std::enable_shared_from_this<FakeDispatchQueue> {
  public:
@@ -36,7 +37,7 @@ class FakeDispatchQueue final : public DispatchQueue,
   [[nodiscard]] const Traits& traits() const { return traits_; }
 
   void async(JobWeight weight, Job job) override;
-  // Refuses by std::logic_error what no queue does: waiting outside a job of its own, waiting
+  // Throws std::logic_error for what no queue allows: waiting outside of one of its jobs, waiting
   // twice, and waiting on a queue with a thread of its own.
   void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
               std::optional<std::chrono::nanoseconds> timeout,
@@ -51,15 +52,15 @@ class FakeDispatchQueue final : public DispatchQueue,
   bool isWaiting_ = false;  // guarded by the service's mutex
 };
 
-// Signals of the fake service. Must not outlive it.
+// A semaphore of the fake service, which it must not outlive.
 class FakeDispatchSemaphore final : public DispatchSemaphore {
  public:
   FakeDispatchSemaphore(FakeDispatchService& service, std::uint64_t signals)
       : service_(service), signals_(signals) {}
 
   void signal() override;
-  // Runs the jobs that may run, but those of the queue whose job waits, until there is a signal;
-  // std::logic_error when none of them signals. May be called by a job.
+  // Runs jobs until there is a signal, except those of the queue whose job waits. Throws
+  // std::logic_error if no job signals: a real thread would wait for ever. A job may call it.
   void wait() override;
 
  private:
@@ -69,39 +70,45 @@ class FakeDispatchSemaphore final : public DispatchSemaphore {
   std::uint64_t signals_;  // guarded by the service's mutex
 };
 
-// A dispatch service without threads. Jobs run on the thread of the test and only when it pumps:
-// one at a time, in the order in which they were added over all queues. Time stands still until the
-// test advances it, and takes the fake clock with it. The jobs of a queue that waits stay until its
-// wait has ended, by a signal or by time. Any thread may add jobs and signal; one may pump.
+// A dispatch service without threads.
+//
+// Jobs run on the test's thread, and only when the test runs them: one at a time, in the order in
+// which they were added to any queue. Time stands still until the test advances it, and the fake
+// clock moves with it. The jobs of a queue that waits remain until its wait has ended, by a signal
+// or by time.
+//
+// Any thread may add jobs and signal; one thread may run them. FakePlatform owns it. Misuse throws
+// std::logic_error.
 class FakeDispatchService final : public DispatchService {
  public:
   // Does not own the clock, which must outlive it.
   explicit FakeDispatchService(FakeClockService& clock) : clock_(clock) {}
   ~FakeDispatchService() override;
 
-  // Runs the jobs that are waiting and those that they add, until none is left but those of queues
-  // that wait; delayed ones stay.
+  // Runs the waiting jobs and those that they add, until only jobs of queues that wait remain.
+  // Delayed jobs remain, too.
   void runUntilIdle();
-  // Runs the job that has waited longest and may run; false when there is none.
+  // Runs the oldest job that may run. Returns false if there is none.
   bool runOne();
-  // Lets time pass: runs all waiting jobs, then each delayed job and the end of each wait at its
-  // time, with all that follows from it, in the order of their times (at one time the delayed jobs
-  // first). The clock shows that time while it runs.
+  // Lets time pass. Runs all waiting jobs; then each delayed job and the end of each wait at its
+  // time, with everything that follows from it. At equal times delayed jobs come first. The clock
+  // shows the time of the job that runs.
   void advance(std::chrono::nanoseconds by);
-  // Drops all jobs that have not run, and ends all waits without a word. Their destructors may add
-  // jobs, which are dropped too.
+  // Drops all jobs that have not run, and ends all waits without calling anything. If the
+  // destructor of a job adds a job, that is dropped too.
   void clear();
 
   [[nodiscard]] std::size_t waitingJobs() const;
   [[nodiscard]] std::size_t delayedJobs() const;
   [[nodiscard]] std::size_t waitingQueues() const;
-  // How long each delayed job still waits, the next one first.
+  // The remaining delay of each delayed job, the next one first.
   [[nodiscard]] std::vector<std::chrono::nanoseconds> delays() const;
-  // Called by whoever signals a semaphore, after each signal: what a thread that waits would find.
+  // Installs a handler that runs after each signal, on the signalling thread. It shows a test the
+  // state that a waiting thread would find.
   void whenSignalled(std::function<void()> handler);
-  // The traits of every queue that was made, in order.
+  // The traits of all queues that were made, in order.
   [[nodiscard]] std::vector<FakeDispatchQueue::Traits> createdQueues() const;
-  // The weights of the jobs added to queues of that label, in order.
+  // The weights of the jobs that were added to queues with that label, in order.
   [[nodiscard]] std::vector<JobWeight> weights(std::string_view label) const;
 
   std::shared_ptr<DispatchQueue> createSerialQueue(std::string_view label, QualityOfService quality,
@@ -131,7 +138,7 @@ class FakeDispatchService final : public DispatchService {
   void addSignal(FakeDispatchSemaphore& semaphore);
   [[nodiscard]] bool tryTakeSignal(FakeDispatchSemaphore& semaphore);
   void setWaiting(FakeDispatchQueue* queue, bool isWaiting);
-  // Under the mutex: lets the queue go on with `then`, in front of its other jobs.
+  // Under the mutex: lets the queue continue with `then`, ahead of its other jobs.
   void endWait(Wait wait, WaitOutcome outcome);
   [[nodiscard]] Waits::iterator firstToTimeOut();
   bool passNext(std::chrono::nanoseconds until);

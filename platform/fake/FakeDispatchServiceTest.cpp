@@ -206,7 +206,7 @@ TEST_F(FakeDispatchServiceTest, AnyThreadMayAddJobs) {
 
 class FakeDispatchWaitTest : public FakeDispatchServiceTest {
  protected:
-  // A job that waits on the semaphore and notes how that ended.
+  // Adds a job that waits on the semaphore and notes the outcome.
   Job waitOn(const std::shared_ptr<DispatchQueue>& queue,
              std::optional<std::chrono::nanoseconds> timeout) {
     return [this, &queue, timeout] {

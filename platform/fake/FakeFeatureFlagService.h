@@ -9,7 +9,8 @@
 
 namespace halvox::platform {
 
-// Feature flags that the test sets; all off at first. Any thread may ask.
+// Feature flags that the test sets; all are disabled at first. Any thread may call. FakePlatform
+// owns it.
 class FakeFeatureFlagService final : public FeatureFlagService {
  public:
   enum class State : unsigned char { kOff, kOn };

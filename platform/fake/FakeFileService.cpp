@@ -71,7 +71,7 @@ std::optional<Error> FakeFileService::createDirectory(std::string_view path,
   const std::lock_guard lock(mutex_);
   known_.emplace(path);
   if (directoryError_.has_value()) return directoryError_;
-  directories_.emplace(path, permissions);  // one that exists stays as it is
+  directories_.emplace(path, permissions);  // an existing directory keeps its permissions
   return std::nullopt;
 }
 

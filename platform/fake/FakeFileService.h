@@ -14,8 +14,8 @@
 
 namespace halvox::platform {
 
-// A file service that keeps what it was given. A committed file has the path
-// "/root<directory>/<name>". Any thread may call; the test reads from its own.
+// Keeps directories and files in memory. A committed file has the path "/root<directory>/<name>".
+// Any thread may call; the test reads on its own. FakePlatform owns it.
 class FakeFileService final : public FileService {
  public:
   struct File {
@@ -28,18 +28,18 @@ class FakeFileService final : public FileService {
   // Does not own the journal, which must outlive it.
   explicit FakeFileService(Journal& journal) : journal_(journal) {}
 
-  // From now on directories cannot be made, or files not be committed, for that reason; none: they
-  // can again. A directory that cannot be made counts as being there, so that a test can tell the
-  // two failures apart.
+  // From now on directories cannot be made, or files cannot be committed, with that error; none
+  // ends it. A directory that could not be made still counts as existing, so that a test can tell
+  // the two failures apart.
   void setDirectoryError(std::optional<Error> error);
   void setFileError(std::optional<Error> error);
 
-  // What was asked for, in order and whatever became of it: "directory /a 511", "file /a/b.json",
+  // All calls in order, whether they succeeded or not: "directory /a 511", "file /a/b.json",
   // "object key = {foo = 1}", "commit".
   [[nodiscard]] std::vector<std::string> steps() const;
   // The permissions of each directory, by its path.
   [[nodiscard]] std::map<std::string, std::uint32_t> directories() const;
-  // The files that were committed, in that order; of one name the last.
+  // The committed files in order; if several have one name, the last.
   [[nodiscard]] std::vector<File> files() const;
   std::optional<Error> createDirectory(std::string_view path, std::uint32_t permissions) override;
   std::unique_ptr<JsonArrayFile> createJsonArrayFile(std::string_view directory,
@@ -54,7 +54,7 @@ class FakeFileService final : public FileService {
   mutable std::mutex mutex_;
   std::optional<Error> directoryError_;
   std::optional<Error> fileError_;
-  std::set<std::string> known_;  // the directories that were asked for
+  std::set<std::string> known_;  // all directories that were to be made
   std::map<std::string, std::uint32_t> directories_;
   std::vector<File> files_;
   std::vector<std::string> steps_;

@@ -4,12 +4,13 @@
 
 namespace halvox::platform {
 
-// Whether two channels of the fake have the same names and the same format: what a set of channels
-// knows them by.
+// Whether two channels of the fake have the same names and format, by which a set of channels
+// identifies them.
 [[nodiscard]] bool areNamedAlike(const FakeIOReportService::Channel& one,
                                  const FakeIOReportService::Channel& other);
 
-// What changed from one list to the other, as IOReportCreateSamplesDelta promises it.
+// The change from one list to the other, as IOReportCreateSamplesDelta promises it. Computed apart
+// from the adapter's code, so that the contract suite compares two implementations.
 [[nodiscard]] FakeIOReportService::ChannelList differences(
     const FakeIOReportService::ChannelList& previous,
     const FakeIOReportService::ChannelList& current);

@@ -10,7 +10,7 @@ namespace {
 
 using ChannelList = FakeIOReportService::ChannelList;
 
-// Channels, subscriptions and samples of the fake know the name of the group that they are of.
+// Channels, subscriptions and samples of the fake carry the name of their group.
 class NamedChannels final : public IOReportChannels {
  public:
   NamedChannels(std::string group, ChannelList content)
@@ -45,7 +45,7 @@ std::optional<std::string_view> view(const std::optional<std::string>& text) {
 
 }  // namespace
 
-// What all groups had counted when the first of them was sampled.
+// The values of all groups when the first of them was sampled.
 class FakeIOReportService::ReadMoment final : public IOReportMoment {
  public:
   std::optional<Groups> groups;

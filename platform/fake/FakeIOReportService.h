@@ -12,12 +12,12 @@
 
 namespace halvox::platform {
 
-// Driver counters that a test makes up. Groups are named as "Speaker-(null)": group, "-",
-// subgroup. Samples are copies of what the test set last, and differences are computed from them.
-// Notes each operation and the group that it is for in the journal. Any thread may call.
+// Driver counters that the test sets. A group has a name such as "Speaker-(null)": group, "-" and
+// subgroup. Samples copy the values that the test set last, and differences are computed from them.
+// Each operation is in the journal with its group. Any thread may call. FakePlatform owns it.
 class FakeIOReportService final : public IOReportService {
  public:
-  // A channel with what it owns.
+  // A channel that owns its texts and values.
   struct Channel {
     IOReportFormat format = IOReportFormat::kSimple;
     IOReportKind kind = IOReportKind::kCounter;  // of a simple channel
@@ -35,7 +35,7 @@ class FakeIOReportService final : public IOReportService {
     [[nodiscard]] IOReportChannel view() const;
   };
   using ChannelList = std::vector<Channel>;
-  // How an operation ends instead of well: without a result, and with that error if there is one.
+  // How an operation fails: without a result, and with that error if there is one.
   struct Failure {
     std::optional<std::int64_t> code{};
   };
@@ -43,17 +43,18 @@ class FakeIOReportService final : public IOReportService {
   // Does not own the journal, which must outlive it.
   explicit FakeIOReportService(Journal& journal) : journal_(journal) {}
 
-  // From now on there is that group, and its channels have counted that much. A test that changes
-  // what they counted sets the group again.
+  // From now on the group exists and its channels have these values. Set it again to change the
+  // values.
   void setGroup(std::string_view name, ChannelList channels);
-  // Is called after each group's samples, as a driver that counts in the meantime; null: no more.
+  // Installs a function that runs after each group's samples, like a driver that counts meanwhile;
+  // null removes it.
   void afterSamples(std::function<void(const std::string& group)> change);
-  // How operations on that group fail from now on.
+  // From now on the operation fails for that group.
   void failChannels(std::string_view name, Failure failure);
   void failSubscription(std::string_view name, Failure failure);
   void failSamples(std::string_view name, Failure failure);
   void failDelta(std::string_view name, Failure failure);
-  // Looking for that group's channels gives an error beside them.
+  // From now on looking for the group's channels returns an error together with the channels.
   void addErrorToChannels(std::string_view name, std::int64_t code);
 
   Channels IOReportCopyChannelsInGroup(Name group, Name subGroup,

@@ -9,7 +9,7 @@
 
 namespace halvox::platform {
 
-// Keeps the trace points that were emitted, in order. Any thread may call.
+// Keeps the trace points in order. Any thread may call. FakePlatform owns it.
 class FakeKdebugService final : public KdebugService {
  public:
   struct Point {

@@ -10,7 +10,7 @@ namespace halvox::platform {
 namespace {
 
 constexpr std::uint64_t kNanosecondsAtTickZero = 1'000'003;
-constexpr int kUnsuitable = 1;  // the error of a call that does not suit the session's state
+constexpr int kUnsuitable = 1;  // a call that does not suit the session's state
 
 std::string hexadecimal(std::uint32_t number) {
   std::array<char, 16> text;
@@ -20,8 +20,8 @@ std::string hexadecimal(std::uint32_t number) {
 
 }  // namespace
 
-// Belongs to who sets it up and then to its queue; what is recorded and whether it records, under
-// the service's lock.
+// Belongs to the code that sets it up and then to its queue. The service's lock guards the recorded
+// events and whether it records.
 class FakeKtraceService::FakeSession final : public KtraceSession {
  public:
   enum class State : std::uint8_t { kMade, kStarted, kEnded, kDestroyed };
@@ -163,7 +163,7 @@ void FakeKtraceService::ktrace_end(const Session& session, int reason) {
       if (!own->hasWalltimes) event.walltime = 0;
       own->deliver(event);
     }
-    // Taken out: the handler may destroy the session and so itself.
+    // Moved out first: the handler may destroy the session, and with it itself.
     if (const auto completion = std::exchange(own->completion, nullptr)) completion();
   });
 }

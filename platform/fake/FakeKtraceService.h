@@ -12,28 +12,32 @@
 
 namespace halvox::platform {
 
-// Kernel traces whose events a test makes up. Its clock is like that of a machine: it did not begin
-// at tick 0, and a tick need not be a whole number of nanoseconds, so that the nanoseconds of a
-// difference are not the difference of the nanoseconds. At first a tick is one nanosecond. What
-// a session recorded is delivered, and its completion called, by a job of its queue after its end.
-// Notes in the journal each operation that has an effect. Any thread may call.
+// Kernel traces with events that the test makes.
+//
+// The clock is like that of a machine: it did not start at tick 0, and a tick need not be a whole
+// number of nanoseconds. Converting a difference and subtracting converted times therefore give
+// different results, as they do on a machine. At first a tick is one nanosecond.
+//
+// After the end of a session a job of its queue delivers the events and then calls the completion.
+// Operations that have an effect are in the journal. Any thread may call. FakePlatform owns it.
 class FakeKtraceService final : public KtraceService {
  public:
   // Does not own the journal, which must outlive it.
   explicit FakeKtraceService(Journal& journal) : journal_(journal) {}
 
-  // Has each session find these events, as far as its ranges go, before those that it recorded.
+  // Gives these events to each session, as far as its ranges allow, before the ones that it
+  // recorded.
   void setEvents(std::vector<trace_point> events);
-  // A program emits this event now: the sessions that record keep it, as far as their ranges go.
+  // Emits an event: the sessions that record now keep it, as far as their ranges allow.
   void emit(const trace_point& event);
   void setNanosecondsPerTick(std::uint64_t nanoseconds) { setTimebase(nanoseconds, 1); }
-  // So many ticks take so many nanoseconds; what is left of a nanosecond is cut off.
+  // That number of ticks takes that number of nanoseconds. Fractions of a nanosecond are cut off.
   void setTimebase(std::uint64_t nanoseconds, std::uint64_t ticks);
-  // From now on these fail with that error; 0 ends it.
+  // From now on these calls fail with that error; 0 ends it.
   void failRange(int error);
   void failStart(int error);
-  // Is called by each start before it does anything else, on its thread: a tracer that takes its
-  // time. Must be set before the first start.
+  // Installs a function that each start calls first, on its thread: a tracer that is slow to start.
+  // Call it before the first start.
   void setTracerDelay(std::function<void()> delay) { delay_ = std::move(delay); }
   // The number of sessions that record now.
   [[nodiscard]] std::size_t recordings() const;
@@ -53,7 +57,7 @@ class FakeKtraceService final : public KtraceService {
  private:
   class FakeSession;
 
-  // The session while it is being set up; null otherwise.
+  // The session if it has not been started; null otherwise.
   static std::shared_ptr<FakeSession> settingUp(const Session& session);
 
   Journal& journal_;

@@ -24,7 +24,7 @@ class FakeLogCategory final : public LogCategory {
 
 namespace {
 
-// What outlives the single services: the categories, and where they write to now.
+// Outlives the services: the categories, and the service that they write to now.
 struct Registry {
   std::mutex mutex;
   std::map<std::pair<std::string, std::string>, std::unique_ptr<FakeLogCategory>> categories;
@@ -38,8 +38,8 @@ Registry& registry() {
   return *instance;
 }
 
-// The prefix is the unit's name, a colon and the number of the line in five places, a blank. The
-// name takes 25 places or more and has no colon in it.
+// Removes the prefix: the unit's name, a colon, the line number in five places, and a space. The
+// name takes at least 25 places and contains no colon.
 std::string_view withoutPrefix(std::string_view line) {
   constexpr std::size_t kLineWidth = 5;
   const std::size_t colon = line.find(':');
@@ -54,7 +54,7 @@ std::string_view withoutPrefix(std::string_view line) {
 
 void FakeLogCategory::write(LogLevel level, std::string_view line) {
   const std::lock_guard lock(registry().mutex);
-  if (registry().receiver == nullptr) return;  // no test is running
+  if (registry().receiver == nullptr) return;  // between two tests
   registry().receiver->record(
       {level, subsystem_, category_, std::string(line), std::string(withoutPrefix(line))});
 }

@@ -10,9 +10,9 @@
 
 namespace halvox::platform {
 
-// Keeps every log line. Code under test remembers the categories that it once got, so categories
-// live as long as the process and write to the newest fake log service. At first every level is
-// wanted. Any thread may log.
+// Keeps every log line. Code under test keeps categories in static variables, so categories live as
+// long as the process and write to the newest fake log service. At first every level is wanted. Any
+// thread may log. FakePlatform owns it.
 class FakeLogService final : public LogService {
  public:
   struct Line {
@@ -29,7 +29,7 @@ class FakeLogService final : public LogService {
   FakeLogService& operator=(const FakeLogService&) = delete;
   ~FakeLogService() override;
 
-  // The least level that is wanted, of every category.
+  // Sets the lowest level that is wanted, for every category.
   void setLevel(LogLevel level);
   void clear();
 

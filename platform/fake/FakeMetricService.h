@@ -10,7 +10,8 @@
 
 namespace halvox::platform {
 
-// A metric service that keeps what was posted. Any thread may call; the test reads from its own.
+// Keeps the metrics that were posted. Any thread may call; the test reads on its own. FakePlatform
+// owns it.
 class FakeMetricService final : public MetricService {
  public:
   struct Metric {

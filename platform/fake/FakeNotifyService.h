@@ -11,18 +11,19 @@
 
 namespace halvox::platform {
 
-// Notifications that the test posts. Tokens count from 1. Any thread may call.
+// Notifications that the test posts. Tokens count from 1. Any thread may call. FakePlatform owns
+// it.
 class FakeNotifyService final : public NotifyService {
  public:
-  static constexpr NotifyStatus kInvalidName = 1;  // of a registration
+  static constexpr NotifyStatus kInvalidName = 1;  // for a name that cannot exist
 
   // From now on registrations of that name fail with that status.
   void failRegistration(std::string_view name, NotifyStatus status);
-  // Queues the handlers that are registered for that name, in the order of their registration.
+  // Adds the handlers of that name to their queues, in the order of registration.
   void post(std::string_view name);
-  // Forgets all registrations and with them what their handlers hold.
+  // Forgets all registrations and releases what their handlers hold.
   void clear();
-  // The names that were registered with success, in order.
+  // The names whose registration succeeded, in order.
   [[nodiscard]] std::vector<std::string> registeredNames() const;
 
   NotifyStatus notify_register_dispatch(std::string_view name, NotifyToken& token,

@@ -60,7 +60,7 @@ class FakePerformanceTraceService::Session final : public KQTraceSession,
 
   FakePerformanceTraceService& service_;
   const std::shared_ptr<DispatchQueue> queue_;
-  bool isRecording_ = false;  // touched by the queue's jobs, and by the destructor after them
+  bool isRecording_ = false;  // used by the queue's jobs, and after them by the destructor
   mutable std::mutex mutex_;
   std::weak_ptr<KQTraceSessionDelegate> delegate_;
 };

@@ -14,28 +14,28 @@
 
 namespace halvox::platform {
 
-// Performance traces that record nothing. They go well unless a test says otherwise; delegates are
-// called by jobs of the service's own queue, so a test hears nothing before it pumps. Notes in the
-// journal what sessions are asked for. Any thread may call.
+// Performance traces that record nothing. They succeed unless the test decides otherwise. Delegates
+// are called by jobs of the service's own queue, so nothing is reported before the test runs jobs.
+// What sessions are asked for is in the journal. Any thread may call. FakePlatform owns it.
 class FakePerformanceTraceService final : public PerformanceTraceService {
  public:
   // Owns neither; both must outlive it and its sessions.
   FakePerformanceTraceService(Journal& journal, DispatchService& dispatch)
       : journal_(journal), dispatch_(dispatch) {}
 
-  // From now on, with that description: no trace begins; recordings fail when they are stopped;
-  // finished traces cannot be saved. An empty one ends it.
+  // From now on, with that description: starts fail; recordings fail when they are stopped;
+  // finished traces cannot be saved. An empty description ends it.
   void failStarts(std::string description);
   void failStops(std::string description);
   void failSaves(std::string description);
-  // From now on nothing is heard of starts and stops: the recorder stands still.
+  // From now on starts and stops are never answered, as with a recorder that hangs.
   void hang();
-  // The URL of the traces that complete from now on; before, each has one of its own.
+  // Sets the URL of the traces that complete from now on. Otherwise each has its own.
   void completeAtStop(std::string url);
 
-  // The delegate of the newest session; null when it has none.
+  // The delegate of the newest session; null if it has none.
   [[nodiscard]] std::shared_ptr<KQTraceSessionDelegate> delegate() const;
-  // The templates that configurations were asked for.
+  // The numbers of the templates that were asked for.
   [[nodiscard]] std::vector<std::int32_t> templates() const;
   // The number of sessions that record now.
   [[nodiscard]] std::size_t recordings() const;
@@ -47,10 +47,10 @@ class FakePerformanceTraceService final : public PerformanceTraceService {
  private:
   class Session;
 
-  // How a stopped recording turns out.
+  // How a stopped recording ends.
   struct Outcome {
     std::optional<Error> stopError{};
-    std::optional<Error> error{};  // of the whole
+    std::optional<Error> error{};  // of the whole trace
     std::string url{};             // empty with an error
   };
   [[nodiscard]] std::shared_ptr<DispatchQueue> queue();

@@ -27,14 +27,14 @@
 
 namespace halvox::platform {
 
-// One fake of each platform service, installed as long as it lives. A test fixture has it as its
-// first member, so that it outlives what is tested. One at a time.
+// One fake of each platform service, installed while it exists. A test fixture has it as its first
+// member, so that it outlives the code under test. One at a time.
 struct FakePlatform {
   FakePlatform();
   FakePlatform(const FakePlatform&) = delete;
   FakePlatform& operator=(const FakePlatform&) = delete;
-  // Drops connections and jobs that did not run while all services are still there, because the
-  // destructors of what they held may call them.
+  // Drops connections and pending jobs while all services still exist, because the destructors of
+  // what they hold may call the services.
   ~FakePlatform();
 
   // The fakes with another analytics service, for a test that installs its own.

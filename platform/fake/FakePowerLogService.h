@@ -11,7 +11,7 @@
 
 namespace halvox::platform {
 
-// A power log that keeps its events. Any thread may call; the test reads from its own.
+// Keeps the power events. Any thread may call; the test reads on its own. FakePlatform owns it.
 class FakePowerLogService final : public PowerLogService {
  public:
   struct Event {
@@ -19,7 +19,7 @@ class FakePowerLogService final : public PowerLogService {
     std::string name;
     Dictionary payload;
     std::optional<Dictionary> extra;
-    // The payload with the entries that `extra` adds to it, as it is recorded.
+    // The payload together with the entries that `extra` adds: what the real service records.
     [[nodiscard]] Dictionary recorded() const;
     friend bool operator==(const Event&, const Event&) = default;
   };
@@ -38,7 +38,7 @@ class FakePowerLogService final : public PowerLogService {
   std::vector<Event> events_;
 };
 
-// For the messages of failed tests.
+// Prints an event in the message of a failed test.
 void PrintTo(const FakePowerLogService::Event& event, std::ostream* stream);
 
 }  // namespace halvox::platform

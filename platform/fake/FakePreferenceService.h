@@ -12,13 +12,13 @@
 
 namespace halvox::platform {
 
-// Settings that the test sets; none at first. Suites are domains of the user "mobile".
-// Any thread may ask.
+// Settings that the test sets; none at first. Suites are domains of the user "mobile". Any thread
+// may call. FakePlatform owns it.
 class FakePreferenceService final : public PreferenceService {
  public:
   static constexpr std::string_view kSuiteUser = "mobile";
 
-  // What somebody asked for.
+  // One look-up.
   struct Read {
     std::string user;
     std::string domain;
@@ -29,7 +29,7 @@ class FakePreferenceService final : public PreferenceService {
   // Sets a value of the user "mobile".
   void set(std::string_view domain, std::string_view key, Value value);
   void remove(std::string_view domain, std::string_view key);
-  // Every question since the last call, in order.
+  // All look-ups since the last call, in order.
   std::vector<Read> takeReads();
 
   [[nodiscard]] std::optional<Value> CFPreferencesCopyValue(

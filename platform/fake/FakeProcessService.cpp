@@ -7,8 +7,8 @@
 namespace halvox::platform {
 namespace {
 
-// How many bytes the character at the start has; 0 for a byte that does not begin one. Overlong
-// forms and surrogates, which no test needs, count as characters.
+// The length of the UTF-8 character at the start; 0 if no character begins there. Overlong forms
+// and surrogates count as characters; no test needs them.
 std::size_t characterLength(std::string_view text) {
   const auto byteAt = [text](std::size_t index) { return static_cast<unsigned char>(text[index]); };
   const unsigned char first = byteAt(0);
@@ -21,7 +21,7 @@ std::size_t characterLength(std::string_view text) {
   return length;
 }
 
-// The name as the port promises it.
+// Replaces bytes that are not UTF-8, as the port promises.
 std::string recordedName(std::string_view name) {
   constexpr std::size_t kLongestName = 15;
   name = name.substr(0, kLongestName);

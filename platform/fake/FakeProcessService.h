@@ -12,12 +12,13 @@
 
 namespace halvox::platform {
 
-// Thrown in place of the end of the process.
+// Thrown instead of ending the process.
 struct FakeTermination {
   int exitStatus;
 };
 
-// Processes that the test makes up; at first there is none but this one. Any thread may ask.
+// Processes that the test makes; at first only this one exists. Any thread may call. FakePlatform
+// owns it.
 class FakeProcessService final : public ProcessService {
  public:
   static constexpr ProcessID kOwnPID = 4711;
@@ -31,7 +32,7 @@ class FakeProcessService final : public ProcessService {
   // Called before terminate() throws.
   void setTerminationHandler(std::function<void(int exitStatus)> handler);
 
-  // How often processes were looked up.
+  // The number of look-ups.
   [[nodiscard]] std::size_t lookUps() const;
   // The exit statuses given to terminate(), in order.
   [[nodiscard]] std::vector<int> terminations() const;

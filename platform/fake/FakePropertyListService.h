@@ -10,13 +10,14 @@
 
 namespace halvox::platform {
 
-// Property-list files that a test makes up. The bytes of a file are the number of its content, so
-// bytes that were read stay what they were when the file changes. Any thread may call.
+// Property-list files that the test makes. The bytes of a file are the number of its content; bytes
+// that were read therefore keep their meaning after the file has changed. Any thread may call.
+// FakePlatform owns it.
 class FakePropertyListService final : public PropertyListService {
  public:
-  // From now on the file of that path holds a property list with that root.
+  // From now on the file contains a property list with that root.
   void setFile(std::string path, Value root);
-  // From now on the file of that path can be read but is no property list.
+  // From now on the file can be read, but is not a property list.
   void setBrokenFile(std::string path);
   void setCurrentDirectory(std::string path);
 
@@ -31,8 +32,8 @@ class FakePropertyListService final : public PropertyListService {
 
   mutable std::mutex mutex_;
   std::string currentDirectory_ = "/current";
-  std::map<std::string, std::size_t, std::less<>> files_;  // by path, the place of its content
-  std::vector<std::optional<Value>> contents_;             // all that there ever was; none: broken
+  std::map<std::string, std::size_t, std::less<>> files_;  // by path: the index of its content
+  std::vector<std::optional<Value>> contents_;             // all contents so far; none: broken
 };
 
 }  // namespace halvox::platform

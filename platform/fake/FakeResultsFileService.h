@@ -13,8 +13,9 @@
 
 namespace halvox::platform {
 
-// Keeps the results files that were written. A file has its name, in the place of one that had it,
-// when it is closed. Notes opening and closing in the journal. Any thread may call.
+// Keeps the results files that were written. A file appears under its name, and replaces an older
+// one, when it is closed. Opening and closing are in the journal. Any thread may call. FakePlatform
+// owns it.
 class FakeResultsFileService final : public ResultsFileService {
  public:
   struct Measurement {
@@ -39,9 +40,9 @@ class FakeResultsFileService final : public ResultsFileService {
   void failToOpen();
   // The same for that path alone.
   void failToOpen(std::string path);
-  // All that were begun, in that order.
+  // All files that were begun, in order.
   [[nodiscard]] std::vector<File> files() const;
-  // The file that has the path; none when none was finished there.
+  // The file with that path; none if none was finished there.
   [[nodiscard]] std::optional<File> finished(const std::string& path) const;
 
   Writer sswriter_open(std::string_view path, std::string_view productName, std::uint32_t version,

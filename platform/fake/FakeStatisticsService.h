@@ -9,17 +9,18 @@
 
 namespace halvox::platform {
 
-// Counters that count from nought for each new fake, though code under test keeps the counters that
-// it once got: they live as long as the process. Any thread may call.
+// Counters that start from zero for each new fake. Code under test keeps references to counters, so
+// these live as long as the process; the fake remembers where each one started. Any thread may
+// call. FakePlatform owns it.
 class FakeStatisticsService final : public StatisticsService {
  public:
   FakeStatisticsService();
 
-  // What was counted since this service was made or cleared; 0 for an unknown counter.
+  // The count since this service was made or cleared; 0 for an unknown counter.
   [[nodiscard]] std::uint64_t value(std::string_view piece, std::string_view name) const;
   // All counters of a piece that are not 0.
   [[nodiscard]] std::map<std::string, std::uint64_t> values(std::string_view piece) const;
-  // Counts from nought again.
+  // Starts from zero again.
   void clear();
 
   Counter& counter(std::string_view piece, std::string_view name) override;

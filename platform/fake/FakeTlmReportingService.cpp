@@ -24,7 +24,7 @@ std::size_t numberOf(const TLMReportingService::Session& session) {
   return dynamic_cast<const FakeTlmReportingSession&>(*session).number();
 }
 
-// "session 1 4/1": whose message, its category and its type.
+// The session, category and type of a message, as "session 1 4/1".
 std::string label(const FakeTlmReportingService::SentMessage& message) {
   const std::string owner =
       message.session == 0 ? "single" : "session " + std::to_string(message.session);
@@ -75,7 +75,7 @@ void FakeTlmReportingService::setOutcome(TLMReportingOutcome outcome) {
 }
 
 void FakeTlmReportingService::clear() {
-  std::deque<BackendsCallback> discoveries;  // destroyed without the lock, with what they own
+  std::deque<BackendsCallback> discoveries;  // destroyed without the lock: callbacks own things
   std::deque<std::function<void()>> flushes;
   const std::lock_guard lock(mutex_);
   discoveries.swap(waitingDiscoveries_);
@@ -163,7 +163,7 @@ void FakeTlmReportingService::answer(Answering answering, BackendsCallback found
     std::thread([&] { found(backends); }).join();
     return;
   }
-  // A queue that only the framework knows stands for its thread.
+  // Only the framework knows this queue; it stands for the framework's thread.
   const auto thread = std::make_shared<FakeDispatchQueue>(
       dispatch_, FakeDispatchQueue::Traits{.label = "real-time framework",
                                            .quality = QualityOfService::kUtility,

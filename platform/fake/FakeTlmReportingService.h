@@ -15,21 +15,21 @@
 
 namespace halvox::platform {
 
-// A real-time framework without servers: it keeps what it was given, and the test says how it
-// answers. At first every discovery finds none, which is told when the test pumps the dispatch
-// service, every flush is done before the call returns, and every message is sent. Any thread may
-// call; the test steers and reads from its own.
+// A real-time framework without servers. It keeps what it was given, and the test decides how it
+// answers. At first every discovery finds no back-end and is answered when the test runs jobs,
+// every flush ends before the call returns, and every message is sent. Any thread may call; the
+// test decides and reads on its own. FakePlatform owns it.
 class FakeTlmReportingService final : public TLMReportingService {
  public:
   enum class Answering : unsigned char {
-    kLater,            // as a job of its own when the test pumps the dispatch service
+    kLater,            // by a job of its own, when the test runs jobs
     kBeforeReturning,  // a discovery on another thread, a flush on this one
     kWhenTold,
   };
 
-  // One message, with what its session or, outside any session, its call said of it.
+  // One message and its session.
   struct SentMessage {
-    std::size_t session;  // from 1 on in the order of creation; 0 outside any session
+    std::size_t session;  // counted from 1 in the order of creation; 0 outside of any session
     std::uint16_t category;
     std::uint16_t type;
     Dictionary payload;
@@ -39,35 +39,36 @@ class FakeTlmReportingService final : public TLMReportingService {
     Dictionary userInfo;
   };
 
-  // Owns neither; the journal must outlive it, and the dispatch service must be there whenever it
-  // answers later.
+  // Does not own its arguments. The journal must outlive it, and the dispatch service must exist
+  // whenever it answers later.
   FakeTlmReportingService(Journal& journal, FakeDispatchService& dispatch)
       : journal_(journal), dispatch_(dispatch) {}
 
-  // From now on discoveries are answered so; `backends` counts unless the test tells each answer.
+  // From now on discoveries are answered in this way, with these back-ends. With kWhenTold the test
+  // gives the back-ends with each answer.
   void answerDiscoveries(Answering answering, std::optional<Array> backends = std::nullopt);
-  // Answers the discovery that has waited longest, on this thread; false when none waits.
+  // Answers the oldest discovery, on this thread. Returns false if none waits.
   bool answerDiscovery(const std::optional<Array>& backends);
   // kLater is not for flushes.
   void answerFlushes(Answering answering);
-  // Ends the flush that has waited longest, on this thread; false when none waits.
+  // Ends the oldest flush, on this thread. Returns false if none waits.
   bool completeFlush();
-  // From now on messages fare so, in sessions and outside.
+  // From now on this is the outcome of messages, inside and outside of sessions.
   void setOutcome(TLMReportingOutcome outcome);
   // Drops the callbacks that were not called.
   void clear();
 
   // The texts of the tokens that were made.
   [[nodiscard]] std::vector<std::string> tokens() const;
-  // What each session was made with, in order of creation.
+  // The arguments of each session, in the order of creation.
   [[nodiscard]] std::vector<Info> sessions() const;
-  // Number of sessions that somebody still holds.
+  // The number of sessions that someone still holds.
   [[nodiscard]] std::size_t liveSessions() const;
   [[nodiscard]] std::size_t waitingDiscoveries() const;
   [[nodiscard]] std::size_t waitingFlushes() const;
-  // The messages given to sessions, whatever became of them.
+  // The messages of sessions, whatever their outcome.
   [[nodiscard]] std::vector<SentMessage> messages() const;
-  // The messages given outside sessions, and what was given with them.
+  // The messages outside of sessions, and the arguments of their calls.
   [[nodiscard]] std::vector<SentMessage> singleMessages() const;
   [[nodiscard]] std::vector<Info> singleMessageInfos() const;
 

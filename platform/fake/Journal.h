@@ -8,7 +8,7 @@
 
 namespace halvox::platform {
 
-// What a journal entry tells of.
+// The kind of a journal entry; the comments say what its text is.
 enum class JournalKind : unsigned char {
   kLogLine,          // text: the line without its prefix
   kTracePoint,       // text: the code as "0x21044828"
@@ -18,7 +18,7 @@ enum class JournalKind : unsigned char {
   kPowerEvent,       // text: the event's name
   kSnapshotRequest,  // text: the signature's description
   kLink,             // text: what the real-time framework was asked for, as "send session 1 4/1"
-  kFile,             // text: what became of a directory or file, as "file /a/b.json"
+  kFile,             // text: the call for a directory or file, as "file /a/b.json"
   kReply,            // text: the name of the method that was answered
   kTermination,      // text: the exit status
   kNote,             // text: whatever the test wrote
@@ -30,15 +30,17 @@ struct JournalEntry {
   friend bool operator==(const JournalEntry&, const JournalEntry&) = default;
 };
 
-// The order in which things reached the fakes, over all of them, so that a test can check the order
-// of steps that go to different services. Any thread may record.
+// The order in which calls reached the fakes, over all of them. Tests use it to check the order of
+// steps that go to different services. Any thread may record. FakePlatform owns it; it must outlive
+// the fakes.
 class Journal {
  public:
   void record(JournalKind kind, std::string_view text);
   // Lets a test mark its own steps.
   void note(std::string_view text) { record(JournalKind::kNote, text); }
   void clear();
-  // Called after each entry by whoever records it, so that a test can look at the state in between.
+  // Installs a handler that runs after each entry, on the recording thread, so that a test can look
+  // at the state in between.
   void whenRecorded(std::function<void(const JournalEntry&)> handler);
 
   [[nodiscard]] std::vector<JournalEntry> entries() const;
@@ -54,7 +56,7 @@ class Journal {
   std::function<void(const JournalEntry&)> handler_;
 };
 
-// For the messages of failed tests.
+// Prints an entry in the message of a failed test.
 void PrintTo(const JournalEntry& entry, std::ostream* stream);
 
 }  // namespace halvox::platform

@@ -15,15 +15,15 @@
 
 namespace halvox::platform::contract {
 
-// An event as it was recorded: its name, and the "number" of its payload.
+// An event as it was recorded: its name, and the entry "number" of its payload.
 using RecordedEvent = std::pair<std::string, std::int64_t>;
 
 // What every AnalyticsService promises.
 //
-// `Harness` is made with the names that are wanted and has
+// `Harness` is constructed with the names that are wanted and has
 //   AnalyticsService& service();
 //   std::vector<RecordedEvent> recorded();
-//     all events so far, once every payload is built; nothing is sent afterwards
+//     all events so far, after every payload has been built; called once, after the last event
 template <typename Harness>
 class AnalyticsContract : public ::testing::Test {
  protected:
@@ -104,7 +104,7 @@ TYPED_TEST_P(AnalyticsContract, PayloadIsBuiltOnceAndNotWithinTheSending) {
 
 TYPED_TEST_P(AnalyticsContract, BuilderSeesWhatChangedAfterTheSending) {
   const auto gate = std::make_shared<std::atomic<std::int64_t>>(0);
-  // The builder waits for the change, which comes after the sending on this very thread.
+  // The builder waits for the change, which this thread makes after sending.
   this->harness_.service().sendAnalyticsEventLazy("e", [gate] {
     while (*gate == 0) std::this_thread::yield();
     return Dictionary{{"number", gate->load()}};

@@ -1,4 +1,4 @@
-// The contract of analytics, kept by the fake.
+// The contract of analytics, run on the fake.
 
 #include "platform/fake/contracts/AnalyticsContract.h"
 

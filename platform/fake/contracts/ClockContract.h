@@ -12,7 +12,7 @@ namespace halvox::platform::contract {
 //
 // `Harness` is default-constructible and has
 //   ClockService& service();
-//   void letPass(std::chrono::milliseconds time);  at least that much
+//   void letPass(std::chrono::milliseconds time);  lets at least that much time pass
 template <typename Harness>
 class ClockContract : public ::testing::Test {
  protected:
@@ -27,7 +27,7 @@ TYPED_TEST_P(ClockContract, UptimesMoveOnWithTime) {
 
   this->harness_.letPass(std::chrono::milliseconds(20));
 
-  // Not so the date: somebody may set it back at any time.
+  // Not the date: it may be set back at any time.
   EXPECT_GE(clock.systemUptime() - system, std::chrono::milliseconds(19));
   EXPECT_GE(clock.processUptime() - process, std::chrono::milliseconds(19));
 }

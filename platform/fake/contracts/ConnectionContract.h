@@ -17,23 +17,23 @@
 
 namespace halvox::platform::contract {
 
-// Who a client of the contract is to the service.
+// The user of a client, as seen by the service.
 enum class ContractUser : std::uint8_t { kOwner, kStranger };
 
-// What a client was answered: a text, or the name of an error.
+// The answer to a client: a text, or the name of an error.
 struct ContractAnswer {
   std::string text;
   std::string errorName;
 };
 
-// One request as the object saw it.
+// One request as the object received it.
 struct SeenRequest {
   std::string text;
   ProcessID currentProcess = 0;  // 0: no connection was current
   RequestToken token;
 };
 
-// The object that the contract exports. Any thread may call.
+// The object that the suite exports. Any thread may call.
 class ContractObject final : public ExportedObject {
  public:
   // Does not own the service, which must outlive it.
@@ -75,8 +75,8 @@ class ContractObject final : public ExportedObject {
   ReplyCallback kept_;
 };
 
-// The object's methods, each with one text: echo answers it, keep does not yet, fail answers an
-// error, end is for the owner and answers it.
+// The object's methods; each takes one text. "echo" answers it, "keep" answers later, "fail"
+// answers an error, "end" is for the owner and answers it.
 inline const NSXPCInterface& contractInterface() {
   constexpr auto kEcho = +[](ExportedObject& object, Invocation&& request) {
     static_cast<ContractObject&>(object).see(request);
@@ -102,7 +102,7 @@ inline const NSXPCInterface& contractInterface() {
   return kInterface;
 }
 
-// Exports an object of its own for each client, and notes what happens to connections.
+// Exports a new object for each client, and notes the events of connections.
 class ContractDelegate final : public NSXPCListenerDelegate {
  public:
   explicit ContractDelegate(const ConnectionService& service) : service_(service) {}
@@ -131,7 +131,7 @@ class ContractDelegate final : public NSXPCListenerDelegate {
     const std::lock_guard held(mutex_);
     return events_;
   }
-  // The object of the last client; null once nobody else holds it.
+  // The object of the latest client; null if nobody else holds it.
   [[nodiscard]] std::shared_ptr<ContractObject> object() const {
     const std::lock_guard held(mutex_);
     return object_.lock();
@@ -161,16 +161,16 @@ class ContractDelegate final : public NSXPCListenerDelegate {
 //
 // `Harness` is default-constructible and has
 //   ConnectionService& service();
-//   void serve(NSXPCListenerDelegate& delegate);  once, before the first client
-//   void end();  serves no longer; nothing calls the delegate's objects afterwards
-//   bool canBe(ContractUser user);
+//   void serve(NSXPCListenerDelegate& delegate);  called once, before the first client
+//   void end();  ends serving; nothing calls the delegate's objects afterwards
+//   bool canBe(ContractUser user);  whether the test can act as that user
 //   Client connect(ContractUser user);
-//   bool letHappen(const std::function<bool()>& condition);  false when it never does
+//   bool letHappen(const std::function<bool()>& condition);  false if it never becomes true
 // and `Client` is movable and has
 //   ProcessID process();
 //   void post(const std::string& method, const std::string& text);  sends a request
-//   std::optional<ContractAnswer> answer();  to the oldest request; none when none comes
-//   void leave();  its end of the connection is gone
+//   std::optional<ContractAnswer> answer();  to the oldest request; none if there is no answer
+//   void leave();  disconnects
 template <typename Harness>
 class ConnectionContract : public ::testing::Test {
  protected:

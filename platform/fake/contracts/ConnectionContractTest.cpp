@@ -1,4 +1,4 @@
-// The contract of connections, kept by the fake.
+// The contract of connections, run on the fake.
 
 #include "platform/fake/contracts/ConnectionContract.h"
 

@@ -21,8 +21,8 @@ namespace halvox::platform::contract {
 // `Harness` is default-constructible and has
 //   DiagnosticReporterService& service();
 //   bool letReply(const std::function<bool()>& condition);
-//     lets the replies to all requests come; false when the condition never holds
-//   void end();  no reply comes afterwards
+//     lets the replies to all requests arrive; false if the condition never becomes true
+//   void end();  ends the service; no reply arrives afterwards
 template <typename Harness>
 class DiagnosticReporterContract : public ::testing::Test {
  protected:

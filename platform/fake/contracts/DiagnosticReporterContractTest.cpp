@@ -1,4 +1,4 @@
-// The contract of diagnostic reporters, kept by the fake.
+// The contract of diagnostic reporters, run on the fake.
 
 #include "platform/fake/contracts/DiagnosticReporterContract.h"
 

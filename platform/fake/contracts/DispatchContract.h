@@ -15,13 +15,13 @@
 
 namespace halvox::platform::contract {
 
-// What every DispatchService promises, whoever runs the jobs.
+// What every DispatchService promises, whatever runs the jobs.
 //
 // `Harness` is default-constructible and has
 //   DispatchService& service();
 //   bool letRunUntil(const std::function<bool()>& condition);
-//     lets jobs run, and delays pass, until the condition holds; false when it never does.
-// The condition may be asked on the test's thread only, while jobs run elsewhere.
+//     lets jobs run, and delays pass, until the condition holds; false if it never does
+// The condition may be called only on the test's thread, while jobs run elsewhere.
 template <typename Harness>
 class DispatchContract : public ::testing::Test {
  protected:
@@ -29,7 +29,7 @@ class DispatchContract : public ::testing::Test {
     return harness_.service().createSerialQueue("com.tarno.halvox.test", QualityOfService::kUtility,
                                                 threading);
   }
-  // True once all jobs that were added before have run.
+  // True when all jobs that were added before have run.
   bool drain(DispatchQueue& queue) {
     const auto done = std::make_shared<std::atomic<bool>>(false);
     queue.async(JobWeight::kBrief, [done] { *done = true; });
@@ -44,7 +44,7 @@ TYPED_TEST_SUITE_P(DispatchContract);
 TYPED_TEST_P(DispatchContract, RunsTheJobsOfOneThreadInTheirOrder) {
   for (const QueueThreading threading : this->kThreadings) {
     const auto queue = this->createQueue(threading);
-    std::vector<int> ran;  // touched by the queue only, read after it was drained
+    std::vector<int> ran;  // used by the queue only; read after the queue was drained
 
     for (int number = 0; number < 1000; ++number) {
       const auto weight = number % 3 == 0 ? JobWeight::kMayBlock : JobWeight::kBrief;

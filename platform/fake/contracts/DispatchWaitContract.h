@@ -14,7 +14,7 @@
 
 namespace halvox::platform::contract {
 
-// What every DispatchService promises of queues that wait on semaphores. `Harness` is that of
+// What every DispatchService promises about queues that wait on semaphores. `Harness` is that of
 // DispatchContract.
 template <typename Harness>
 class DispatchWaitContract : public ::testing::Test {
@@ -29,7 +29,7 @@ class DispatchWaitContract : public ::testing::Test {
   std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals) {
     return harness_.service().createSemaphore(signals);
   }
-  // Adds a job that begins a wait, whose end notes its outcome in the steps.
+  // Adds a job that begins a wait. The end of the wait adds its outcome to the steps.
   void addWait(const std::shared_ptr<DispatchQueue>& queue,
                const std::shared_ptr<DispatchSemaphore>& semaphore, Timeout timeout) {
     queue->async(JobWeight::kBrief, [this, queue, semaphore, timeout] {
@@ -52,7 +52,7 @@ class DispatchWaitContract : public ::testing::Test {
   bool letEnd(int waits) {
     return harness_.letRunUntil([this, waits] { return ended_ == waits; });
   }
-  // True once all jobs that were added before have run.
+  // True when all jobs that were added before have run.
   bool drain(DispatchQueue& queue) {
     const auto done = std::make_shared<std::atomic<bool>>(false);
     queue.async(JobWeight::kBrief, [done] { *done = true; });
@@ -62,10 +62,10 @@ class DispatchWaitContract : public ::testing::Test {
   static constexpr std::chrono::nanoseconds kShort = std::chrono::milliseconds(20);
   static constexpr std::chrono::nanoseconds kLong = std::chrono::hours(1);
 
-  Steps steps_;  // touched by one queue at a time, read after it was drained
+  Steps steps_;  // used by one queue at a time; read after the queue was drained
   std::atomic<int> begun_{0};
   std::atomic<int> ended_{0};
-  Harness harness_;  // last: no job runs any more when the rest goes
+  Harness harness_;  // last, so that no job runs when the other members are destroyed
 };
 TYPED_TEST_SUITE_P(DispatchWaitContract);
 
@@ -248,7 +248,7 @@ TYPED_TEST_P(DispatchWaitContract, LetsGoOfWhatTheWaitHeldOnceItHasEnded) {
 TYPED_TEST_P(DispatchWaitContract, AThreadThatBlocksGoesOnAfterASignal) {
   const auto queue = this->createQueue();
   const auto semaphore = this->createSemaphore(1);
-  semaphore->wait();  // takes the signal that is there
+  semaphore->wait();  // consumes the signal that exists
   this->addStep(*queue, "before the signal");
   queue->async(JobWeight::kBrief, [semaphore] { semaphore->signal(); });
 

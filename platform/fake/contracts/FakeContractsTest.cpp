@@ -1,4 +1,4 @@
-// The contracts of the ports, kept by the fakes.
+// The contracts of the ports, run on the fakes.
 
 #include <atomic>
 #include <chrono>

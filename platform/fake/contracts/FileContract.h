@@ -14,9 +14,9 @@ namespace halvox::platform::contract {
 
 // What every FileService promises. `Harness` has
 //   FileService& service();
-//   std::vector<std::string> names(const std::string& directory);  // of the files, in any order
+//   std::vector<std::string> names(const std::string& directory);  // of its files, in any order
 //   std::vector<std::string> keys(const std::string& directory, const std::string& name);
-//     // of the objects in the file's array, one after the other
+//     // of the objects in the file's array, in order
 template <typename Harness>
 class FileContract : public ::testing::Test {
  protected:

@@ -1,4 +1,4 @@
-// The contract of files, kept by the fake.
+// The contract of files, run on the fake.
 
 #include "platform/fake/contracts/FileContract.h"
 

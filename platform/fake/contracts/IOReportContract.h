@@ -19,8 +19,8 @@ namespace halvox::platform::contract {
 // `Harness` is default-constructible and has
 //   IOReportService& service();
 //   void set(FakeIOReportService::ChannelList channels);
-//                                what the drivers have, and have counted, from now on
-// The groups and subgroups that the suite asks for are those of kIOReportGroups.
+//                                sets the channels of the drivers and their values
+// The groups and subgroups that the suite uses are those of kIOReportGroups.
 using ChannelOfDriver = FakeIOReportService::Channel;
 
 struct GroupAndSubGroup {
@@ -30,7 +30,7 @@ struct GroupAndSubGroup {
 inline const std::vector<GroupAndSubGroup> kIOReportGroups{
     {"Speaker", std::nullopt}, {std::nullopt, "MCA"}, {"Rx", "MCA"}, {"Tx", std::nullopt}};
 
-// What the tests of the suite are made of.
+// Shared by the tests of the suite.
 template <typename Harness>
 class IOReportContract : public ::testing::Test {
  protected:
@@ -57,7 +57,7 @@ class IOReportContract : public ::testing::Test {
                       {.name = "off", .inTransitions = 0, .residency = off}};
     return channel;
   }
-  // Of [0, 10), [10, 20) and all above.
+  // Buckets [0, 10), [10, 20) and an open one from 20.
   static ChannelOfDriver histogram(std::vector<std::uint64_t> hits) {
     ChannelOfDriver channel = counter(0);
     channel.format = IOReportFormat::kHistogram;
@@ -65,7 +65,7 @@ class IOReportContract : public ::testing::Test {
     return channel;
   }
 
-  // Subscribes to a group as the service does at its start.
+  // Subscribes to a group, as the service does when it starts.
   void subscribe(IOReportService::Name group, IOReportService::Name subGroup = std::nullopt) {
     std::optional<IOReportError> error;
     auto& service = harness_.service();
@@ -92,7 +92,7 @@ class IOReportContract : public ::testing::Test {
     std::optional<IOReportError> error;
     return show(harness_.service().IOReportCreateSamplesDelta(previous, current, error));
   }
-  // What changes when the drivers first have the one and then the other.
+  // The delta between samples of the first and of the second list of channels.
   Texts change(ChannelList before, ChannelList after) {
     harness_.set(std::move(before));
     subscribe("Speaker");
@@ -101,7 +101,7 @@ class IOReportContract : public ::testing::Test {
     return delta(previous, sample());
   }
 
-  // "Amp<1>/Speaker/Stats/pulses 42 pulses"
+  // A channel as text, such as "Amp<1>/Speaker/Stats/pulses 42 pulses".
   static std::string describe(const IOReportChannel& channel) {
     std::string text;
     for (const auto& part :
@@ -180,7 +180,7 @@ TYPED_TEST_P(IOReportContract, SamplesStayAsTheyWere) {
   EXPECT_THAT(this->show(samples), ElementsAre("Amp<1>/Speaker/Stats/pulses 7 pulses"));
 }
 
-// However soon it comes after another.
+// However soon after another session.
 TYPED_TEST_P(IOReportContract, NoReadingIsUsedThatIsOlderThanTheMoment) {
   this->harness_.set({this->counter(0)});
   this->subscribe("Speaker");
@@ -339,7 +339,7 @@ TYPED_TEST_P(IOReportContract, TheExtremesOfADifferenceAreThoseOfTheBucketsThatG
 
   EXPECT_THAT(extremes({5, 1, 2}, {5, 3, 2}), ElementsAre(10, 20));
   EXPECT_THAT(extremes({5, 1, 2}, {6, 2, 2}), ElementsAre(0, 20));
-  // An open bucket is known by where it begins.
+  // An open bucket is known by its lower bound.
   EXPECT_THAT(extremes({5, 1, 2}, {5, 2, 3}), ElementsAre(10, 20));
   EXPECT_THAT(extremes({5, 1, 2}, {5, 1, 3}), ElementsAre(20, 20));
   EXPECT_THAT(extremes({5, 1, 2}, {5, 1, 2}), ElementsAre(0, 0));

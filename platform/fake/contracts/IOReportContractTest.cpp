@@ -1,4 +1,4 @@
-// The contract of the drivers' counters, kept by the fake.
+// The contract of the drivers' counters, run on the fake.
 
 #include "platform/fake/contracts/IOReportContract.h"
 

@@ -19,12 +19,12 @@ namespace halvox::platform::contract {
 //   KtraceService& service();
 //   std::shared_ptr<DispatchQueue> createQueue();
 //   bool letRunUntil(const std::function<bool()>& condition);
-//     lets queues run until the condition holds; false when it never does
+//     lets queues run until the condition holds; false if it never does
 //   void emit(const std::vector<std::uint32_t>& codes);
-//     has a program emit these events in this order, each later than the one before it; what
-//     records has them when this returns
-//   std::size_t recordings();  how many there are in the tracer
-//   void breakTracer();        before the first start: no recording can begin
+//     lets a program emit these events in this order, each later than the one before; recordings
+//     have them when this returns
+//   std::size_t recordings();  the number of recordings in the tracer
+//   void breakTracer();        lets no recording begin; called before the first start
 template <typename Harness>
 class KtraceContract : public ::testing::Test {
  protected:
@@ -32,11 +32,12 @@ class KtraceContract : public ::testing::Test {
   static constexpr std::uint32_t kHigh = 0x21040014;
   using Codes = std::vector<std::uint32_t>;
 
-  // What the handlers of one session saw. Touched by the session's queue, and read after `ended`.
+  // What the handlers of one session received. The session's queue writes it; read it after
+  // `ended`.
   struct Seen {
     std::vector<trace_point> events;
     std::atomic<int> completions{0};
-    bool isElsewhere = false;  // a handler was called outside the queue, or after the completion
+    bool isElsewhere = false;  // a handler ran outside of the queue, or after the completion
 
     [[nodiscard]] Codes codes() const {
       Codes codes;
@@ -65,7 +66,7 @@ class KtraceContract : public ::testing::Test {
     EXPECT_EQ(service().ktrace_events_range(session, kLow, kHigh, seeInto(seen)), 0);
     return session;
   }
-  // What a session's owner does from its queue.
+  // The calls that a session's owner makes on its queue.
   void onQueue(std::function<void()> work) {
     std::atomic<bool> isDone{false};
     queue_->async(JobWeight::kMayBlock, [&] {
@@ -90,7 +91,7 @@ class KtraceContract : public ::testing::Test {
     ASSERT_TRUE(harness_.letRunUntil([&] { return seen.completions > 0; }));
     EXPECT_FALSE(seen.isElsewhere);
   }
-  // Another session's whole life, behind which nothing of an earlier one is still to come.
+  // The whole life of another session. After it, nothing of an earlier one can be pending.
   void letLifePass() {
     Seen other;
     const auto session = create(other);

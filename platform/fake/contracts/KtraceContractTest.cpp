@@ -1,4 +1,4 @@
-// The contract of kernel traces, kept by the fake.
+// The contract of kernel traces, run on the fake.
 
 #include "platform/fake/contracts/KtraceContract.h"
 

@@ -11,9 +11,9 @@ namespace halvox::platform::contract {
 
 // What every LogService promises.
 //
-// `Harness` is made from the least level that is wanted and has
+// `Harness` is constructed with the lowest level that is wanted and has
 //   LogService& service();
-//   std::vector<std::string> lines();  what was written so far, in order, without time and names
+//   std::vector<std::string> lines();  all lines so far in order, without times and names
 template <typename Harness>
 class LogContract : public ::testing::Test {};
 TYPED_TEST_SUITE_P(LogContract);

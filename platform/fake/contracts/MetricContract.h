@@ -15,10 +15,10 @@
 
 namespace halvox::platform::contract {
 
-// A metric as it was recorded: its identifier, and the bytes of its message.
+// A metric as it was recorded: its identifier and the bytes of its message.
 using RecordedMetric = std::pair<std::uint32_t, std::string>;
 
-// A message of one text in field 3; without one, of no field.
+// A message with one text in field 3, or with no field if there is no text.
 class ContractMessage final : public ProtoBase {
  public:
   explicit ContractMessage(std::optional<std::string> text) : text_(std::move(text)) {}
@@ -38,7 +38,7 @@ class ContractMessage final : public ProtoBase {
 //
 // `Harness` is default-constructible and has
 //   MetricService& service();
-//   std::vector<RecordedMetric> recorded();  all metrics so far; nothing is posted afterwards
+//   std::vector<RecordedMetric> recorded();  all metrics so far; called once, after the last one
 template <typename Harness>
 class MetricContract : public ::testing::Test {
  protected:

@@ -1,4 +1,4 @@
-// The contract of metrics, kept by the fake.
+// The contract of metrics, run on the fake.
 
 #include "platform/fake/contracts/MetricContract.h"
 

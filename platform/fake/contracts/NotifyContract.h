@@ -16,13 +16,13 @@ namespace halvox::platform::contract {
 //   NotifyService& service();
 //   std::shared_ptr<DispatchQueue> queue();
 //   void post(const std::string& name);
-//   bool letRunUntil(const std::function<bool()>& condition);  // false when it never holds
+//   bool letRunUntil(const std::function<bool()>& condition);  // false if it never becomes true
 template <typename Harness>
 class NotifyContract : public ::testing::Test {
  protected:
   static constexpr const char* kName = "org.example.changed";
 
-  // A registration and what its handler got.
+  // A registration, and the calls of its handler.
   struct Listener {
     NotifyStatus status = 0;
     NotifyToken token = 0;
@@ -39,7 +39,7 @@ class NotifyContract : public ::testing::Test {
         });
     return listener;
   }
-  // Posts the name until the listener has heard so often, one post after the other.
+  // Posts the name until the listener was called that often, one post after the other.
   bool letHear(const Listener& listener, const std::string& name, int calls) {
     for (int call = listener.calls + 1; call <= calls; ++call) {
       harness_.post(name);

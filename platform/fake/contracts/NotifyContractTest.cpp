@@ -1,4 +1,4 @@
-// The contract of notifications, kept by the fake.
+// The contract of notifications, run on the fake.
 
 #include "platform/fake/contracts/NotifyContract.h"
 

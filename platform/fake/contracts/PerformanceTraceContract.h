@@ -19,18 +19,18 @@ namespace halvox::platform::contract {
 // `Harness` is default-constructible and has
 //   PerformanceTraceService& service();
 //   bool letRunUntil(const std::function<bool()>& condition);
-//     lets the service work until the condition holds; false when it never does
-//   std::size_t recordings();  how many there are in the tracer
-//   void breakTracer();        no recording can begin
-//   void breakRecorder();      what is recorded now cannot be ended well
-//   void breakSaving();        finished traces cannot be saved
+//     lets the service work until the condition holds; false if it never does
+//   std::size_t recordings();  the number of recordings in the tracer
+//   void breakTracer();        lets no recording begin
+//   void breakRecorder();      makes the end of the current recordings fail
+//   void breakSaving();        makes saving a finished trace fail
 template <typename Harness>
 class PerformanceTraceContract : public ::testing::Test {
  protected:
   using Texts = std::vector<std::string>;
   using Session = std::shared_ptr<KQTraceSession>;
 
-  // Writes down what it hears.
+  // Notes its calls.
   class Listener final : public KQTraceSessionDelegate {
    public:
     void kqTraceDidStart(const std::optional<Error>& error) override {
@@ -94,7 +94,7 @@ class PerformanceTraceContract : public ::testing::Test {
     EXPECT_EQ(listener->heard(), texts);
     return isHeard;
   }
-  // The start of another trace, whose outcome comes behind all that was asked for before.
+  // Starts another trace. Its outcome comes after everything that was asked for before.
   void letWorkPass() {
     const auto other = std::make_shared<Listener>();
     const Session session = create(other);

@@ -1,4 +1,4 @@
-// The contract of performance traces, kept by the fake.
+// The contract of performance traces, run on the fake.
 
 #include "platform/fake/contracts/PerformanceTraceContract.h"
 

@@ -13,7 +13,7 @@
 
 namespace halvox::platform::contract {
 
-// A power event as it was recorded: with the numbers "a" and "b" of its payload, where it has them.
+// A power event as it was recorded, with the entries "a" and "b" of its payload if it has them.
 struct RecordedPowerEvent {
   std::uint32_t categoryID;
   std::string name;
@@ -26,7 +26,7 @@ struct RecordedPowerEvent {
 //
 // `Harness` is default-constructible and has
 //   PowerLogService& service();
-//   std::vector<RecordedPowerEvent> recorded();  all events so far; nothing is logged afterwards
+//   std::vector<RecordedPowerEvent> recorded();  all events so far; called once, after the last one
 template <typename Harness>
 class PowerLogContract : public ::testing::Test {
  protected:

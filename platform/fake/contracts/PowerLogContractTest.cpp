@@ -1,4 +1,4 @@
-// The contract of the power log, kept by the fake.
+// The contract of the power log, run on the fake.
 
 #include "platform/fake/contracts/PowerLogContract.h"
 

@@ -14,7 +14,7 @@ namespace halvox::platform::contract {
 // What every PreferenceService promises. `Harness` has
 //   PreferenceService& service();
 //   void set(const std::string& domain, const std::string& key, const Value& value);
-//     // of the user "mobile"; texts, integers, reals and booleans
+//     // for the user "mobile"; texts, integers, reals and booleans
 //   void remove(const std::string& domain, const std::string& key);
 template <typename Harness>
 class PreferenceContract : public ::testing::Test {

@@ -1,4 +1,4 @@
-// The contract of preferences, kept by the fake.
+// The contract of preferences, run on the fake.
 
 #include "platform/fake/contracts/PreferenceContract.h"
 

@@ -13,12 +13,12 @@ namespace halvox::platform::contract {
 //
 // `Harness` is default-constructible and has
 //   ProcessService& service();
-//   ProcessID startProcess(const std::string& commandName);  a process of that name, running
-//   void renameProcess(ProcessID pid, const std::string& commandName);  such a one renames itself
-//   void endProcess(ProcessID pid);  ends such a one; afterwards it is gone
+//   ProcessID startProcess(const std::string& commandName);  starts a process with that name
+//   void renameProcess(ProcessID pid, const std::string& commandName);  lets it rename itself
+//   void endProcess(ProcessID pid);  ends it; afterwards there is no such process
 //   int exitStatusOf(int status);
-//     the exit status of a process that calls terminate(status), of a copy if need be; -1 when the
-//     call returned or ran on
+//     the exit status of a process that calls terminate(status), perhaps of a copy of this one; -1
+//     if the call returned
 template <typename Harness>
 class ProcessContract : public ::testing::Test {
  protected:

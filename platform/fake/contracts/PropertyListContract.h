@@ -18,11 +18,11 @@ namespace halvox::platform::contract {
 // `Harness` is default-constructible and has
 //   PropertyListService& service();
 //   std::string write(const std::string& name, const Value& root);
-//     puts a property list with that root into the file of that name, in place of what was there,
-//     and gives the file's path; the root is a tree of dictionaries, arrays, texts, integers, reals
-//     and booleans
-//   std::string writeBroken(const std::string& name);  the same with what is no property list
-//   std::string missing();                             the path of a file that is not there
+//     writes a property list with that root to the file of that name, replacing an older one, and
+//     returns the path; the root is a tree of dictionaries, arrays, texts, integers, reals and
+//     booleans
+//   std::string writeBroken(const std::string& name);  writes a file that is not a property list
+//   std::string missing();                             the path of a file that does not exist
 template <typename Harness>
 class PropertyListContract : public ::testing::Test {
  protected:

@@ -1,4 +1,4 @@
-// The contract of property lists, kept by the fake.
+// The contract of property lists, run on the fake.
 
 #include "platform/fake/contracts/PropertyListContract.h"
 

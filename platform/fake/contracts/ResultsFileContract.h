@@ -12,11 +12,11 @@
 
 namespace halvox::platform::contract {
 
-// What a reader finds in a results file.
+// The content of a results file.
 struct ResultsFileContent {
   std::string product;
   std::uint32_t version = 0;
-  // By name, the names in the order in which their first values came.
+  // Values by name; the names are in the order of their first values.
   std::vector<std::pair<std::string, std::vector<double>>> values;
   friend bool operator==(const ResultsFileContent&, const ResultsFileContent&) = default;
 };
@@ -25,9 +25,9 @@ struct ResultsFileContent {
 //
 // `Harness` is default-constructible and has
 //   ResultsFileService& service();
-//   std::string usable(const std::string& name);  a path where a file can be made
-//   std::string unusable();                       one where none can
-//   std::optional<ResultsFileContent> read(const std::string& path);  none: there is no such file
+//   std::string usable(const std::string& name);  a path at which a file can be created
+//   std::string unusable();                       a path at which none can
+//   std::optional<ResultsFileContent> read(const std::string& path);  none if there is no such file
 template <typename Harness>
 class ResultsFileContract : public ::testing::Test {
  protected:

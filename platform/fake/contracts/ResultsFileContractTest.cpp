@@ -1,4 +1,4 @@
-// The contract of results files, kept by the fake.
+// The contract of results files, run on the fake.
 
 #include "platform/fake/contracts/ResultsFileContract.h"
 

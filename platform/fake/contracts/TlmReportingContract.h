@@ -17,12 +17,12 @@ namespace halvox::platform::contract {
 
 // What every TLMReportingService promises. `Harness` has
 //   TLMReportingService& service();
-//   bool letRunUntil(const std::function<bool()>& condition);  // false when it never holds
-//   static constexpr bool kFindsBackends;   // what a discovery finds
-//   static constexpr bool kTakesMessages;   // what becomes of a message
-//   std::vector<std::int64_t> arrived();    // the numbers of what the servers have, in their order
+//   bool letRunUntil(const std::function<bool()>& condition);  // false if it never becomes true
+//   static constexpr bool kFindsBackends;   // whether a discovery finds any
+//   static constexpr bool kTakesMessages;   // whether a message is taken
+//   std::vector<std::int64_t> arrived();    // the numbers of the servers' messages, in order
 //   void breakSending();                    // from now on messages are not taken
-// and, when it needs a server, static bool isAvailable(), without which nothing is tested.
+// and, if it needs a server, static bool isAvailable(); without the server the suite is skipped.
 template <typename Harness>
 class TlmReportingContract : public ::testing::Test {
  protected:
@@ -71,7 +71,7 @@ class TlmReportingContract : public ::testing::Test {
   bool letAnswer(const Discovery& discovery) {
     return harness_.letRunUntil([&] { return discovery.answers > 0; });
   }
-  // A session whose back-ends were looked for, as sessions do it before they send.
+  // A session that has looked for back-ends, as sessions do before they send.
   TLMReportingService::Session openSession(std::int64_t id) {
     auto session = createSession(id);
     EXPECT_TRUE(letAnswer(*discover(session)));
@@ -86,7 +86,7 @@ class TlmReportingContract : public ::testing::Test {
     return service().TLMReportingSendOneMessage({{kTLMReportingSessionInfoSessionID, -1}},
                                                 userInfo(), {4, 1, payload});
   }
-  // Whether the outcome says what the framework does with messages, with a text for a failure.
+  // Whether the outcome is the one that the framework promises, with a text for a failure.
   static bool isAsPromised(const TLMReportingOutcome& outcome, bool isTaken) {
     if (isTaken) return outcome.sent && !outcome.error.has_value();
     return !outcome.sent && outcome.error.has_value() && !outcome.error->description.empty();
@@ -114,7 +114,7 @@ TYPED_TEST_P(TlmReportingContract, ADiscoveryIsAnsweredLaterAndNotFromInsideTheC
   EXPECT_EQ(discovery->backends.has_value(), TypeParam::kFindsBackends);
 }
 
-// Whatever the framework knows from the first time.
+// Also for a framework that remembers the first discovery.
 TYPED_TEST_P(TlmReportingContract, LaterDiscoveriesAreNotAnsweredFromInsideTheCallEither) {
   const auto session = this->openSession(1);
 
@@ -135,7 +135,7 @@ TYPED_TEST_P(TlmReportingContract, EachOfManyDiscoveriesIsAnsweredExactlyOnce) {
   }
 
   for (const auto& discovery : discoveries) ASSERT_TRUE(this->letAnswer(*discovery));
-  this->openSession(kDiscoveries);  // time for whatever would be called twice
+  this->openSession(kDiscoveries);  // leaves time for a callback that is called twice
 
   for (const auto& discovery : discoveries) EXPECT_EQ(discovery->answers, 1);
 }

@@ -1,4 +1,4 @@
-// The contract of the real-time framework, kept by the fake.
+// The contract of the real-time framework, run on the fake.
 
 #include "platform/fake/contracts/TlmReportingContract.h"
 
