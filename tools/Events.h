@@ -3,7 +3,7 @@
 #include <ostream>
 #include <string>
 
-#include "platform/linux/store/StoreReader.h"
+#include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Command.h"
 #include "tools/StoreRun.h"
 

@@ -4,7 +4,7 @@
 #include <span>
 #include <string>
 
-#include "platform/linux/store/StoreReader.h"
+#include "platform/linux/store/reading/StoreReader.h"
 
 // The names of what the link stored as numbers.
 namespace halvox::tools {

@@ -5,7 +5,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/store/StoreReader.h"
+#include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Command.h"
 #include "tools/StoreRun.h"
 

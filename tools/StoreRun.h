@@ -7,8 +7,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/store/EventFollower.h"
-#include "platform/linux/store/StoreReader.h"
+#include "platform/linux/store/reading/EventFollower.h"
+#include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Command.h"
 
 namespace halvox::tools {

@@ -3,12 +3,12 @@
 #include <string>
 #include <utility>
 
-#include "platform/linux/store/EventFollower.h"
 #include "platform/linux/store/SqliteMetricService.h"
 #include "platform/linux/store/SqlitePowerLogService.h"
 #include "platform/linux/store/StoreFixture.h"
-#include "platform/linux/store/StoreReader.h"
 #include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/reading/EventFollower.h"
+#include "platform/linux/store/reading/StoreReader.h"
 
 namespace halvox::platform::linux_ {
 namespace {

@@ -5,9 +5,9 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/store/RecordScan.h"
 #include "platform/linux/store/Sqlite.h"
-#include "platform/linux/store/StoreReader.h"
+#include "platform/linux/store/reading/RecordScan.h"
+#include "platform/linux/store/reading/StoreReader.h"
 
 namespace halvox::platform::linux_ {
 

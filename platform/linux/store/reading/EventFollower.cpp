@@ -1,4 +1,4 @@
-#include "platform/linux/store/EventFollower.h"
+#include "platform/linux/store/reading/EventFollower.h"
 
 #include <algorithm>
 #include <array>

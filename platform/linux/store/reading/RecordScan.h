@@ -7,7 +7,7 @@
 
 #include "platform/linux/store/RecordTables.h"
 #include "platform/linux/store/Sqlite.h"
-#include "platform/linux/store/StoreReader.h"
+#include "platform/linux/store/reading/StoreReader.h"
 
 namespace halvox::platform::linux_ {
 

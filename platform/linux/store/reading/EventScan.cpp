@@ -1,4 +1,4 @@
-#include "platform/linux/store/EventScan.h"
+#include "platform/linux/store/reading/EventScan.h"
 
 #include <algorithm>
 #include <string_view>

@@ -1,4 +1,4 @@
-#include "platform/linux/store/StoreReader.h"
+#include "platform/linux/store/reading/StoreReader.h"
 
 #include <string>
 #include <vector>

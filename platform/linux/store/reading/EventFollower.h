@@ -5,7 +5,7 @@
 
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/store/StoreError.h"
-#include "platform/linux/store/StoreReader.h"
+#include "platform/linux/store/reading/StoreReader.h"
 
 namespace halvox::platform::linux_ {
 

@@ -1,4 +1,4 @@
-#include "platform/linux/store/RecordScan.h"
+#include "platform/linux/store/reading/RecordScan.h"
 
 #include <algorithm>
 #include <utility>

@@ -1,4 +1,4 @@
-#include "platform/linux/store/StoreReader.h"
+#include "platform/linux/store/reading/StoreReader.h"
 
 #include <cerrno>
 #include <chrono>
@@ -7,10 +7,10 @@
 #include <sys/stat.h>
 
 #include "platform/linux/base/ErrnoText.h"
-#include "platform/linux/store/EventScan.h"
-#include "platform/linux/store/RecordScan.h"
 #include "platform/linux/store/StoreOpening.h"
 #include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/reading/EventScan.h"
+#include "platform/linux/store/reading/RecordScan.h"
 
 namespace halvox::platform::linux_ {
 namespace {
