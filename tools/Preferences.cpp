@@ -6,11 +6,11 @@
 #include <utility>
 #include <variant>
 
-#include "platform/linux/settings/PreferenceEditing.h"
 #include "platform/linux/settings/PreferenceFile.h"
-#include "platform/linux/settings/PreferenceWriting.h"
 #include "platform/linux/settings/SettingNames.h"
 #include "tools/JsonText.h"
+#include "tools/PreferenceEditing.h"
+#include "tools/PreferenceWriting.h"
 #include "tools/ServiceConfiguration.h"
 
 namespace halvox::tools {
@@ -19,7 +19,6 @@ namespace {
 using platform::Value;
 using platform::linux_::Configuration;
 using platform::linux_::PreferenceFileError;
-using platform::linux_::PreferenceValue;
 
 std::string shown(const Value& value, bool json) {
   if (!json && value.isString()) return harmlessText(value.string());
@@ -55,18 +54,17 @@ ExitStatus get(const Preferences& request, const std::filesystem::path& file, bo
   return ExitStatus::kDone;
 }
 
-ExitStatus change(const std::filesystem::path& file, const platform::linux_::PreferenceEdit& edit,
+ExitStatus change(const std::filesystem::path& file, const PreferenceEdit& edit,
                   const Complaint& complain) {
-  const auto error = platform::linux_::changePreferenceFile(file, edit);
+  const auto error = changePreferenceFile(file, edit);
   if (error.has_value()) return complain(ExitStatus::kCannotWrite, error->description);
   return ExitStatus::kDone;
 }
 
 ExitStatus set(const Preferences& request, const std::filesystem::path& file,
                const Complaint& complain) {
-  auto parsed = platform::linux_::parsePreferenceValue(
-      *request.value, request.isString ? platform::linux_::ValueForm::kString
-                                       : platform::linux_::ValueForm::kTomlOrString);
+  auto parsed = parsePreferenceValue(
+      *request.value, request.isString ? ValueForm::kString : ValueForm::kTomlOrString);
   if (const auto* error = std::get_if<PreferenceFileError>(&parsed)) {
     return complain(ExitStatus::kBadArguments, error->description);
   }
@@ -87,7 +85,7 @@ ExitStatus unset(const Preferences& request, const std::filesystem::path& file,
   const ExitStatus status = change(
       file,
       [&](std::string_view text, const std::filesystem::path& named) {
-        auto edited = platform::linux_::withoutPreference(text, *request.key, named);
+        auto edited = withoutPreference(text, *request.key, named);
         const auto* result = std::get_if<std::string>(&edited);
         wasThere = result == nullptr || *result != text;
         return edited;

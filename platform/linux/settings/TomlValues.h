@@ -1,6 +1,6 @@
 #pragma once
 
-// Converts parsed TOML to values. Include it only in sources of this folder: the parser is large.
+// Converts parsed TOML to values. Include it only in sources: the parser is large.
 
 #define TOML_HEADER_ONLY 0  // the configuration's source compiles the parser
 #define TOML_EXCEPTIONS 0

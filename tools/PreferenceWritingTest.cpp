@@ -1,4 +1,4 @@
-#include "platform/linux/settings/PreferenceWriting.h"
+#include "tools/PreferenceWriting.h"
 
 #include <fcntl.h>
 #include <sys/file.h>
@@ -8,8 +8,12 @@
 #include "platform/linux/settings/SettingsFixture.h"
 #include "platform/linux/testing/FileSizeLimit.h"
 
-namespace halvox::platform::linux_ {
+namespace halvox::tools {
 namespace {
+
+using platform::linux_::FileSizeLimit;
+using platform::linux_::PreferenceFileError;
+using platform::linux_::SettingsFixture;
 
 class PreferenceWritingTest : public SettingsFixture {
  protected:
@@ -141,4 +145,4 @@ TEST_F(PreferenceWritingTest, WhatIsNoRegularFileIsLeftAlone) {
 }
 
 }  // namespace
-}  // namespace halvox::platform::linux_
+}  // namespace halvox::tools

@@ -1,9 +1,17 @@
-#include "platform/linux/settings/PreferenceEditing.h"
+#include "tools/PreferenceEditing.h"
 
 #include <gtest/gtest.h>
 
-namespace halvox::platform::linux_ {
+namespace halvox::tools {
 namespace {
+
+using platform::Array;
+using platform::Date;
+using platform::Dictionary;
+using platform::Value;
+using platform::linux_::kLargestPreferenceFile;
+using platform::linux_::parsePreferences;
+using platform::linux_::PreferenceFileError;
 
 PreferenceValue value(std::string_view text, ValueForm form = ValueForm::kTomlOrString) {
   return std::get<PreferenceValue>(parsePreferenceValue(text, form));
@@ -130,4 +138,4 @@ TEST(PreferenceEditingTest, AFileThatWouldBeTooLargeIsRefused) {
 }
 
 }  // namespace
-}  // namespace halvox::platform::linux_
+}  // namespace halvox::tools

@@ -1,4 +1,4 @@
-#include "platform/linux/settings/PreferenceWriting.h"
+#include "tools/PreferenceWriting.h"
 
 #include <cerrno>
 #include <cstdlib>
@@ -15,8 +15,15 @@
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/settings/LinkedFiles.h"
 
-namespace halvox::platform::linux_ {
+namespace halvox::tools {
 namespace {
+
+using platform::linux_::errnoText;
+using platform::linux_::linkedFiles;
+using platform::linux_::PreferenceFileError;
+using platform::linux_::PreferenceText;
+using platform::linux_::readPreferenceText;
+using platform::linux_::UniqueFd;
 
 // Readable by everyone, as far as the umask allows.
 constexpr mode_t kModeOfNewFiles = 0644;
@@ -125,4 +132,4 @@ std::optional<PreferenceFileError> changePreferenceFile(const std::filesystem::p
   return replace(file, after, old.has_value() ? old->mode : modeOfNewFile(), held.get());
 }
 
-}  // namespace halvox::platform::linux_
+}  // namespace halvox::tools

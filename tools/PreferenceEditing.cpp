@@ -1,4 +1,4 @@
-#include "platform/linux/settings/PreferenceEditing.h"
+#include "tools/PreferenceEditing.h"
 
 #include <algorithm>
 #include <array>
@@ -11,8 +11,22 @@
 #include "platform/linux/settings/SettingNames.h"
 #include "platform/linux/settings/TomlValues.h"
 
-namespace halvox::platform::linux_ {
+namespace halvox::tools {
 namespace {
+
+using platform::Dictionary;
+using platform::Value;
+using platform::linux_::appendEscaped;
+using platform::linux_::isNestedTooDeep;
+using platform::linux_::isUtf8;
+using platform::linux_::kLargestPreferenceFile;
+using platform::linux_::nextUtf8;
+using platform::linux_::parsePreferences;
+using platform::linux_::PreferenceFileError;
+using platform::linux_::shownName;
+using platform::linux_::toDictionary;
+using platform::linux_::toValue;
+using platform::linux_::Utf8Step;
 
 using Edited = std::variant<std::string, PreferenceFileError>;
 
@@ -200,4 +214,4 @@ Edited withoutPreference(std::string_view text, std::string_view key,
   return verified(std::move(edited), expected, parsed, key, file);
 }
 
-}  // namespace halvox::platform::linux_
+}  // namespace halvox::tools
