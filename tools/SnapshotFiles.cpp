@@ -13,10 +13,10 @@
 #include <vector>
 
 #include "platform/linux/diagnostics/SnapshotDirectory.h"
-#include "platform/linux/diagnostics/SnapshotReader.h"
 #include "tools/Arguments.h"
 #include "tools/JsonText.h"
 #include "tools/ServiceConfiguration.h"
+#include "tools/SnapshotReader.h"
 
 namespace halvox::tools {
 namespace {
@@ -25,8 +25,6 @@ namespace fs = std::filesystem;
 
 using platform::Dictionary;
 using platform::Value;
-using platform::linux_::ExistingFiles;
-using platform::linux_::SnapshotReadError;
 
 constexpr const char* kSignatureName = "signature.json";
 constexpr const char* kManifestName = "manifest.json";
@@ -66,7 +64,7 @@ struct Contents {
 
 // What a snapshot tells of itself, or what is wrong with it.
 std::variant<Contents, std::string> readContents(const fs::path& file) {
-  auto read = platform::linux_::readSnapshotFiles(file, {kSignatureName, kManifestName});
+  auto read = readSnapshotFiles(file, {kSignatureName, kManifestName});
   if (auto* error = std::get_if<SnapshotReadError>(&read)) return std::move(error->description);
   const auto& texts = std::get<std::map<std::string, std::string>>(read);
   Contents contents;
@@ -176,7 +174,7 @@ ExitStatus extractSnapshot(const ExtractSnapshot& request, OutputForm form, std:
   if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
   const auto& file = std::get<fs::path>(found);
   const fs::path directory = request.directory.empty() ? stemOf(file) : request.directory;
-  const auto extracted = platform::linux_::extractSnapshot(
+  const auto extracted = unpackSnapshot(
       file, directory, request.force ? ExistingFiles::kReplace : ExistingFiles::kRefuse);
   if (const auto* error = std::get_if<SnapshotReadError>(&extracted)) {
     return complain(ExitStatus::kRefused, error->description);

@@ -8,7 +8,7 @@
 #include <variant>
 #include <vector>
 
-namespace halvox::platform::linux_ {
+namespace halvox::tools {
 
 struct SnapshotReadError {
   std::string description;  // names the file and the reason
@@ -34,8 +34,8 @@ enum class ExistingFiles : std::uint8_t { kRefuse, kReplace };
 //
 // Changes the working directory of the process while it runs, so no other thread may use relative
 // paths.
-[[nodiscard]] std::variant<std::vector<std::string>, SnapshotReadError> extractSnapshot(
+[[nodiscard]] std::variant<std::vector<std::string>, SnapshotReadError> unpackSnapshot(
     const std::filesystem::path& snapshot, const std::filesystem::path& directory,
     ExistingFiles existing);
 
-}  // namespace halvox::platform::linux_
+}  // namespace halvox::tools

@@ -1,4 +1,4 @@
-#include "platform/linux/diagnostics/SnapshotReader.h"
+#include "tools/SnapshotReader.h"
 
 #include <algorithm>
 #include <array>
@@ -14,12 +14,15 @@
 
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
-#include "platform/linux/diagnostics/BoundedFile.h"
 
-namespace halvox::platform::linux_ {
+namespace halvox::tools {
 namespace {
 
 namespace fs = std::filesystem;
+
+using platform::linux_::errnoText;
+using platform::linux_::UniqueFd;
+using platform::linux_::UniqueHandle;
 
 using Reader = UniqueHandle<archive*, archive_read_free>;
 using DiskWriter = UniqueHandle<archive*, archive_write_free>;
@@ -231,9 +234,9 @@ std::variant<std::map<std::string, std::string>, SnapshotReadError> readSnapshot
   return texts;
 }
 
-std::variant<std::vector<std::string>, SnapshotReadError> extractSnapshot(const fs::path& snapshot,
-                                                                          const fs::path& directory,
-                                                                          ExistingFiles existing) {
+std::variant<std::vector<std::string>, SnapshotReadError> unpackSnapshot(const fs::path& snapshot,
+                                                                         const fs::path& directory,
+                                                                         ExistingFiles existing) {
   // Fails when the current working directory was deleted.
   std::error_code error;
   const fs::path source = fs::absolute(snapshot, error);
@@ -247,4 +250,4 @@ std::variant<std::vector<std::string>, SnapshotReadError> extractSnapshot(const 
   return unpacked;
 }
 
-}  // namespace halvox::platform::linux_
+}  // namespace halvox::tools

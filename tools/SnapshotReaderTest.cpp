@@ -1,15 +1,21 @@
-#include "platform/linux/diagnostics/SnapshotReader.h"
+#include "tools/SnapshotReader.h"
 
 #include <sys/stat.h>
 
 #include "platform/linux/diagnostics/SnapshotFixture.h"
 
-namespace halvox::platform::linux_ {
+namespace halvox::tools {
 namespace {
 
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 using ::testing::Pair;
+
+using platform::linux_::readText;
+using platform::linux_::ScratchDirectory;
+using platform::linux_::TestEntry;
+using platform::linux_::writeArchive;
+using platform::linux_::writeText;
 
 class SnapshotReaderTest : public ::testing::Test {
  protected:
@@ -17,7 +23,7 @@ class SnapshotReaderTest : public ::testing::Test {
   std::string unpack(const std::vector<TestEntry>& entries,
                      ExistingFiles existing = ExistingFiles::kRefuse) {
     writeArchive(archive, entries);
-    const auto result = extractSnapshot(archive, target, existing);
+    const auto result = unpackSnapshot(archive, target, existing);
     const auto* error = std::get_if<SnapshotReadError>(&result);
     return error == nullptr ? "" : error->description;
   }
@@ -120,7 +126,7 @@ TEST_F(SnapshotReaderTest, EntryThatCannotBeUnpackedIsNamedWithTheReason) {
 }
 
 TEST_F(SnapshotReaderTest, EmptyNameIsAMissingFile) {
-  EXPECT_EQ(extractSnapshot("", target, ExistingFiles::kRefuse).index(), 1U);
+  EXPECT_EQ(unpackSnapshot("", target, ExistingFiles::kRefuse).index(), 1U);
   const auto read = readSnapshotFiles("", {"a"});
 
   ASSERT_EQ(read.index(), 1U);
@@ -134,7 +140,7 @@ TEST_F(SnapshotReaderTest, DeletedWorkingDirectoryIsAnError) {
   std::filesystem::current_path(gone);
   std::filesystem::remove(gone);
 
-  const auto result = extractSnapshot("a.tar.zst", target, ExistingFiles::kRefuse);
+  const auto result = unpackSnapshot("a.tar.zst", target, ExistingFiles::kRefuse);
   std::filesystem::current_path(before);
 
   ASSERT_EQ(result.index(), 1U);
@@ -156,8 +162,8 @@ TEST_F(SnapshotReaderTest, TruncatedArchiveIsAnError) {
   std::filesystem::resize_file(archive, std::filesystem::file_size(archive) / 2);
 
   EXPECT_EQ(readSnapshotFiles(archive, {"a", "b"}).index(), 1U);
-  EXPECT_EQ(extractSnapshot(archive, target, ExistingFiles::kRefuse).index(), 1U);
+  EXPECT_EQ(unpackSnapshot(archive, target, ExistingFiles::kRefuse).index(), 1U);
 }
 
 }  // namespace
-}  // namespace halvox::platform::linux_
+}  // namespace halvox::tools
