@@ -8,13 +8,15 @@
 #include <gtest/gtest.h>
 #include <pipewire/pipewire.h>
 
+#include "platform/linux/pipewire/testing/PrivatePipeWire.h"
 #include "reporters/pipewire/MainLoop.h"
-#include "reporters/pipewire/PrivatePipeWire.h"
 #include "reporters/pipewire/RecordingReportingClient.h"
 
 namespace halvox::pipewire_reporter {
 namespace {
 
+using pipewire_testing::ChildProcess;
+using pipewire_testing::PrivatePipeWire;
 using std::chrono::steady_clock;
 constexpr std::chrono::seconds kDeadline{30};
 

@@ -13,15 +13,15 @@
 
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/drivers/testing/MadeReadings.h"
+#include "platform/linux/pipewire/testing/PrivatePipeWire.h"
 #include "platform/linux/testing/ScratchDirectory.h"
-#include "reporters/pipewire/PrivatePipeWire.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
 using namespace std::chrono_literals;
-using pipewire_reporter::ChildProcess;
-using pipewire_reporter::PrivatePipeWire;
+using pipewire_testing::ChildProcess;
+using pipewire_testing::PrivatePipeWire;
 using ::testing::ElementsAre;
 using Clock = std::chrono::steady_clock;
 

@@ -7,7 +7,7 @@
 
 #include <sys/types.h>
 
-namespace halvox::pipewire_reporter {
+namespace halvox::pipewire_testing {
 
 // For tests: a child process with pipes to its standard input and output. The destructor closes the
 // input, sends SIGTERM and waits for the process. A program that cannot be started is one that has
@@ -59,4 +59,4 @@ class PrivatePipeWire {
   bool ready_ = false;
 };
 
-}  // namespace halvox::pipewire_reporter
+}  // namespace halvox::pipewire_testing

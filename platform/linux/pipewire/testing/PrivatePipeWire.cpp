@@ -1,4 +1,4 @@
-#include "reporters/pipewire/PrivatePipeWire.h"
+#include "platform/linux/pipewire/testing/PrivatePipeWire.h"
 
 #include <array>
 #include <cmath>
@@ -14,7 +14,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-namespace halvox::pipewire_reporter {
+namespace halvox::pipewire_testing {
 namespace {
 
 constexpr std::uint32_t kRate = 48000;
@@ -168,4 +168,4 @@ void PrivatePipeWire::enterEnvironment() const {
   }
 }
 
-}  // namespace halvox::pipewire_reporter
+}  // namespace halvox::pipewire_testing
