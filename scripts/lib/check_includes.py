@@ -1,31 +1,26 @@
 #!/usr/bin/env python3
-"""Proves from the include lines that the arrows between the folders run one way.
+"""Proves from the include lines that folders include only what scripts/lib/arrows.txt allows.
 
-The inner ring reaches nothing but the standard library, the headers directly in platform/ and
-itself, and its folders reach each other only as ALLOWED says. Prints one line per breach with file
-and line, and a closing line; exits with 1 when there was a breach.
+The table says which folder may include headers of which others, and which folders may include the
+headers of a library. Folders of the inner ring may include nothing of the operating system or of a
+library at all. Prints one line for each breach, with file and line, and a closing line. Exits with 1
+if there was a breach.
+
+    check_includes.py [TABLE]     checks the git working tree in the current directory
 """
 
 import re
 import subprocess
 import sys
+from dataclasses import dataclass, field
 from pathlib import Path
 
-# What each folder of the inner ring may include, besides the standard library.
-ALLOWED = {
-    "platform": {"platform"},
-    "backends": {"backends", "platform"},
-    "driver": {"driver", "session", "backends", "platform"},
-    "session": {"session", "backends", "tracing", "platform"},
-    "tracing": {"tracing", "platform"},
-    "service": {"service", "session", "backends", "driver", "tracing", "platform"},
-}
-# Sources (not headers) of these folders may include these further folders.
-ALLOWED_IN_SOURCES = {"backends": {"session"}}
-# The composition root knows the adapters; tests know the fakes.
-COMPOSITION_ROOT = "service/main.cpp"
-TEST_FOLDERS = {"platform/fake"}
-TEST_LIBRARIES = {"gtest/gtest.h", "gmock/gmock.h"}
+TABLE = Path(__file__).parent / "arrows.txt"
+
+# Folders whose code is plain C++ on the standard library.
+INNER_RING = {"platform", "backends", "driver", "session", "tracing", "service"}
+TEST_FOLDERS = {"platform/fake", "platform/linux/testing"}
+TEST_LIBRARIES = ("gtest/", "gmock/")
 
 STANDARD = set(
     """algorithm any array atomic barrier bit bitset cassert cctype cerrno cfenv cfloat charconv chrono
@@ -41,62 +36,183 @@ STANDARD = set(
 
 INCLUDE = re.compile(r'^\s*#\s*include\s*([<"])([^">]+)[">]')
 CONDITIONAL = re.compile(r"^\s*#\s*(if|ifdef|ifndef|elif|else)\b")
+TEST_FILE = re.compile(r"(Test|_test|Fixture)\.\w+$|/(testing|testdata)/")
 
 
-def folder_of(path: str) -> str:
-    """The folder that the rules speak of: its first part, or platform/linux and the like."""
-    parts = path.split("/")
-    if parts[0] == "platform" and len(parts) > 2:
-        return "/".join(parts[:2])
-    return parts[0]
+class TableError(Exception):
+    """A line of the table that cannot be understood."""
 
 
-def allowed_folders(path: str) -> set[str]:
-    folder = folder_of(path)
-    allowed = set(ALLOWED[folder])
-    if path.endswith(".cpp"):
-        allowed |= ALLOWED_IN_SOURCES.get(folder, set())
-    if is_test(path):
-        allowed |= TEST_FOLDERS | {"session", "service"}
-    return allowed
+@dataclass
+class Row:
+    """What one folder or file may include besides itself: each folder with the line that allows it."""
+
+    everything: dict[str, int] = field(default_factory=dict)
+    sources: dict[str, int] = field(default_factory=dict)
+    tests: dict[str, int] = field(default_factory=dict)
+
+
+class Table:
+    def __init__(self, text: str):
+        self.rows: dict[str, Row] = {}
+        self.libraries: dict[str, set[str]] = {}
+        self._used: set[int | tuple[int, str]] = set()
+        row = None
+        for number, line in enumerate(text.splitlines(), start=1):
+            content = line.split("#", 1)[0].rstrip()
+            if not content:
+                continue
+            name, colon, others = content.strip().partition(":")
+            if not colon:
+                raise TableError(f"line {number}: expected 'NAME: FOLDERS', found '{content}'")
+            if content.startswith("<"):
+                self.libraries[name.strip("<>")] = set(others.split())
+                continue
+            allowed = {other: number for other in others.split()}
+            if not content[0].isspace():
+                if name in self.rows:
+                    raise TableError(f"line {number}: {name} has a row already")
+                row = self.rows[name] = Row(allowed)
+            elif row is not None and name in ("sources", "tests"):
+                setattr(row, name, allowed)
+            else:
+                raise TableError(f"line {number}: expected 'sources:' or 'tests:' below a row")
+        for name, row in self.rows.items():
+            for others in (row.everything, row.sources, row.tests):
+                for other, number in others.items():
+                    if other not in self.rows:
+                        raise TableError(f"line {number}: {other} has no row of its own")
+
+    def folder_of(self, path: str) -> str | None:
+        """The folder of a file: the longest one with a row. None if there is none."""
+        parts = path.split("/")[:-1]
+        if parts[:1] == ["platform"] and len(parts) > 1 and parts[1] not in ("linux", "fake"):
+            return None
+        while parts:
+            if "/".join(parts) in self.rows:
+                # platform/linux is a row for its own files only: each adapter has one.
+                if parts == ["platform", "linux"] and path.count("/") > 2:
+                    return None
+                return "/".join(parts)
+            parts.pop()
+        return None
+
+    def circle(self) -> list[str]:
+        """The folders of a circle of arrows that hold for headers; empty if there is none."""
+        done: set[str] = set()
+
+        def visit(name: str, path: list[str]) -> list[str]:
+            if name in path:
+                return path[path.index(name):] + [name]
+            if name in done:
+                return []
+            for other in self.rows[name].everything:
+                if found := visit(other, path + [name]):
+                    return found
+            done.add(name)
+            return []
+
+        return next((found for name in self.rows if (found := visit(name, []))), [])
+
+    def allows(self, path: str, other: str) -> bool:
+        """True if a file may include headers of the folder `other`. Notes that the arrow is used."""
+        folder = self.folder_of(path)
+        row = self.rows[folder]
+        of_file = self.rows.get(path, Row())
+        # The first that allows it is the one that is used: an arrow for tests that the folder has
+        # anyway would be reported as unused.
+        kinds = [row.everything, of_file.everything]
+        if path.endswith((".cpp", ".c")):
+            kinds.append(row.sources)
+        if is_test(path):
+            kinds.append(row.tests)
+        for kind in kinds:
+            if other in kind:
+                self._used.add((kind[other], other))
+                return True
+        return other == folder or (is_test(path) and other in TEST_FOLDERS)
+
+    def breaches(self, path: str, text: str):
+        """Yields the number and the description of each line that breaks a rule."""
+        folder = self.folder_of(path)
+        if folder is None:
+            yield 1, f"its folder has no row in {TABLE.name}"
+            return
+        for number, line in enumerate(text.splitlines(), start=1):
+            if folder in INNER_RING and path not in self.rows and CONDITIONAL.match(line):
+                yield number, "conditional compilation belongs to the adapters"
+            match = INCLUDE.match(line)
+            if not match:
+                continue
+            quote, name = match.groups()
+            what = self._library(path, name) if quote == "<" else self._header(path, name)
+            if what:
+                yield number, what
+
+    def _library(self, path: str, name: str) -> str | None:
+        if name in STANDARD or (is_test(path) and name.startswith(TEST_LIBRARIES)):
+            return None
+        folder = self.folder_of(path)
+        if folder in INNER_RING and path not in self.rows:
+            return f"<{name}> is not a header of the standard library"
+        if is_test(path):
+            return None
+        for prefix, folders in self.libraries.items():
+            if name.startswith(prefix) and not any(f"{path}/".startswith(f"{one}/") for one in folders):
+                return f"<{name}> may be included only by {', '.join(sorted(folders))}"
+        return None
+
+    def _header(self, path: str, name: str) -> str | None:
+        other = self.folder_of(name)
+        if other is None:
+            return f'"{name}" is in a folder that has no row in {TABLE.name}'
+        if is_test(name) and not is_test(path):
+            return f'"{name}" is for tests only'
+        if not self.allows(path, other):
+            return f'{self.folder_of(path)} may not include {other} ("{name}")'
+        return None
+
+    def unused(self):
+        """Yields the line and the description of each arrow that no file has needed so far."""
+        for name, row in self.rows.items():
+            for others in (row.everything, row.sources, row.tests):
+                for other, number in others.items():
+                    if (number, other) not in self._used:
+                        yield number, f"no include line uses the arrow from {name} to {other}; remove it"
 
 
 def is_test(path: str) -> bool:
-    return bool(re.search(r"(Test|_test|Fixture)\.(cpp|h)$", path))
+    """True for tests, benchmarks, and files that only these use."""
+    return bool(TEST_FILE.search(path)) or path.startswith(("platform/fake/", "bench/", "tests/"))
 
 
-def breaches_of(path: str):
-    allowed = allowed_folders(path)
-    text = Path(path).read_text(encoding="utf-8", errors="replace")
-    for number, line in enumerate(text.splitlines(), start=1):
-        if CONDITIONAL.match(line):
-            yield number, "conditional compilation belongs to the adapters"
-        match = INCLUDE.match(line)
-        if not match:
-            continue
-        quote, name = match.groups()
-        if quote == "<":
-            if name in STANDARD or (is_test(path) and name in TEST_LIBRARIES):
-                continue
-            yield number, f"<{name}> is not of the standard library"
-        elif folder_of(name) not in allowed:
-            yield number, f'"{name}" is out of reach for {folder_of(path)}/'
-
-
-def main() -> int:
+def main(arguments: list[str]) -> int:
+    table_file = Path(arguments[0]) if arguments else TABLE
+    try:
+        table = Table(table_file.read_text(encoding="utf-8"))
+    except TableError as error:
+        print(f"{table_file.name}: {error}")
+        return 1
     listed = subprocess.run(
-        ["git", "ls-files", "--cached", "--others", "--exclude-standard", "*.h", "*.cpp"],
+        ["git", "ls-files", "--cached", "--others", "--exclude-standard", "*.h", "*.cpp", "*.c"],
         check=True, capture_output=True, text=True,
     ).stdout.split()
-    inner = [path for path in listed if folder_of(path) in ALLOWED and path != COMPOSITION_ROOT]
+    files = [path for path in listed if Path(path).is_file()]
     count = 0
-    for path in inner:
-        for number, what in breaches_of(path):
+    for path in files:
+        text = Path(path).read_text(encoding="utf-8", errors="replace")
+        for number, what in table.breaches(path, text):
             print(f"{path}:{number}: {what}")
             count += 1
-    print(f"includes: {len(inner)} files of the inner ring read, {count} breaches")
-    return 1 if count or not inner else 0
+    for number, what in table.unused():
+        print(f"{table_file.name}:{number}: {what}")
+        count += 1
+    if circle := table.circle():
+        print(f"{table_file.name}: the arrows form a circle: {' -> '.join(circle)}")
+        count += 1
+    print(f"includes: {len(files)} files read, {count} breaches")
+    return 1 if count or not files else 0
 
 
 if __name__ == "__main__":
-    sys.exit(main())
+    sys.exit(main(sys.argv[1:]))
