@@ -16,25 +16,28 @@ namespace halvox::client {
 using platform::Dictionary;
 using platform::Value;
 
+// The number of a session, chosen by the program that creates it. 0 means no session.
 using ReporterID = std::int64_t;
+// What client/Vocabulary.h names: what a message is about, what happened, and what kind of audio a
+// session is for.
 using Category = std::uint32_t;
 using EventType = std::uint16_t;
 using ServiceType = std::uint16_t;
 
-// Why a request got no answer of its own.
+// Why a request has no result.
 struct Failure {
   enum class Kind : std::uint8_t {
-    kNoService,  // nobody serves the socket, or the connection ended before the answer
-    kRefused,    // the service answered with an error
-    kTimedOut,
-    kBadRequest,  // the request could not be put on the wire (a value it has no form for, too
-                  // large)
+    kNoService,   // nobody serves the socket, or the connection ended before the answer
+    kRefused,     // the service answered with an error
+    kTimedOut,    // no answer within the time-out; the request may have been carried out
+    kBadRequest,  // the request has no form on the wire: a text that is not UTF-8, or too large
   };
   Kind kind = Kind::kNoService;
-  std::string name;     // the D-Bus error name, when the service gave one
+  std::string name;     // the D-Bus error name; empty if the service gave none
   std::string message;  // one line for a person
 };
 
+// Either a value or a failure, never both. True if there is no failure.
 template <typename T>
 struct Result {
   std::optional<T> value;
@@ -43,51 +46,53 @@ struct Result {
 };
 
 struct Options {
-  // Where the service listens; empty: the first of the usual places that has a service. These are
-  // $HALVOX_SOCKET alone when it is set, else the user's, $XDG_RUNTIME_DIR/halvox/reporting.sock,
-  // then the system's, /run/halvox/reporting.sock.
+  // The socket of the service. If it is empty, the client tries $HALVOX_SOCKET alone if that is
+  // set; otherwise the user's service, $XDG_RUNTIME_DIR/halvox/reporting.sock, then the system's
+  // service, /run/halvox/reporting.sock. It takes the first place at which a service listens.
   std::string socketPath;
-  // What may wait for the client's thread: sends past either bound are dropped and counted.
+  // Bounds of the messages that wait for the client's thread, in number and in bytes of memory.
+  // Beyond either, send() drops and counts them.
   std::size_t maxPendingMessages = 8192;
   std::size_t maxPendingBytes = 8U << 20U;
-  // How long a synchronous request waits.
+  // How long making a connection may take.
   std::chrono::milliseconds requestTimeout{5000};
-  // First and longest pause between attempts to reach a service that is not there.
+  // The first and the longest pause between attempts to connect. Pauses grow from one to the other.
   std::chrono::milliseconds reconnectMin{50};
   std::chrono::milliseconds reconnectMax{2000};
-  // How long a client whose connection ended looks for a service at the same place only. A service
-  // that starts again must not lose its clients to another one meanwhile.
+  // How long a client whose connection ended tries only the same place. A service that is being
+  // restarted must not lose its clients to another one.
   std::chrono::milliseconds samePlaceFor{10'000};
 };
 
-// What became of the messages that were handed over.
-// accepted = acknowledged + refused + lost + pending.
+// How many messages have had which outcome: accepted = acknowledged + refused + lost + pending.
 struct Counters {
-  std::uint64_t accepted = 0;      // taken by send()
-  std::uint64_t dropped = 0;       // not taken: the hand-off was full or the client was closing
-  std::uint64_t acknowledged = 0;  // answered by the service
-  std::uint64_t refused = 0;       // answered with an error, or without a form on the wire
-  // In flight when a connection ended: the service may have had them, so they are not sent again.
-  // Also what waited when more than 8,192 session operations had piled up without a service.
+  std::uint64_t accepted = 0;      // send() returned true
+  std::uint64_t dropped = 0;       // send() returned false: a bound is reached, or the client ends
+  std::uint64_t acknowledged = 0;  // answered by the service without an error
+  std::uint64_t refused = 0;       // answered with an error, or not representable on the wire
+  // In flight when a connection ended. The service may have received them, so they are not sent
+  // again. Also messages that waited when 8,192 session operations had piled up without a service.
   std::uint64_t lost = 0;
-  std::uint64_t pending = 0;  // waiting or in flight
-  std::uint64_t reconnects = 0;
+  std::uint64_t pending = 0;     // waiting or in flight
+  std::uint64_t reconnects = 0;  // connections made after the first one
 };
 
-// A program's link to the reporting service.
+// A program's connection to the reporting service, for programs that must not wait for it.
 //
-// One thread of its own does all the talking: every operation below is a hand-off to it, in order,
-// and the requests are pipelined. When the service goes away the client waits for it to come back,
-// connects again and makes its sessions again: created, typed, configured and, if they were
-// running, started. Messages handed over meanwhile wait, up to the bounds.
+// One thread of its own exchanges all messages with the service. The operations below hand work to
+// that thread, in order, and requests are pipelined. If the service ends, the client waits for a
+// new one, connects to it and makes its sessions again: created, typed, configured and, if they
+// were running, started. Messages that are handed over meanwhile wait, up to the bounds.
 //
-// Any thread may call. send() never blocks, locks for long or waits for the service, so an audio
-// thread may call it; it does allocate when the message does. The other operations may wait for a
-// lock for a moment. Destruction delivers what is pending for at most a second and ends the thread.
+// Any thread may call. send() never blocks, takes no lock and does not wait for the service, so an
+// audio thread may call it. It allocates only for a list of several sessions, and makes one system
+// call if the client's thread is asleep. The other operations may wait for a lock for a moment.
+// After fork(), a client works only in the process that made it.
 //
-// The numbers that categories, types and services stand for are in client/Vocabulary.h. A client
-// does not work in a process that was forked off its own. Making one throws std::system_error or
-// std::bad_alloc when there is no thread or no memory to be had.
+// The caller owns the client. Construction does not wait for the service and succeeds without one.
+// It throws std::system_error if there is no thread, and std::bad_alloc if there is no memory.
+// Destruction delivers pending messages for at most one second if the service is there, then ends
+// the thread.
 class HalvoxClient {
  public:
   explicit HalvoxClient(Options options = {});
@@ -95,8 +100,9 @@ class HalvoxClient {
   HalvoxClient(const HalvoxClient&) = delete;
   HalvoxClient& operator=(const HalvoxClient&) = delete;
 
-  // Session operations, in the order of a session's life. They return at once; what the service
-  // answers to them is logged by nobody: a session that the service does not have is not an error.
+  // The steps of a session's life, in their order. They return at once. The service reports no
+  // error for a session that it does not know, so a step for one has no effect. setConfiguration()
+  // merges the dictionary into what the session has.
   void createSession(ReporterID id);
   void setServiceType(ReporterID id, ServiceType type);
   void setConfiguration(ReporterID id, Dictionary configuration);
@@ -104,22 +110,26 @@ class HalvoxClient {
   void stop(ReporterID id);
   void destroySession(ReporterID id);
 
-  // Hands one message over for that session. False when it was dropped; see counters().
+  // Hands one message over for a session, which may be another client's. Returns false if the
+  // message was dropped; see counters().
   bool send(ReporterID id, Dictionary message, Category category, EventType type);
-  // The same for several sessions, or with no list at all for all active ones.
+  // The same for several sessions, or without a list for all started sessions of all programs.
   bool send(std::optional<std::vector<ReporterID>> ids, Dictionary message, Category category,
             EventType type);
 
-  // Waits until everything handed over before has been answered or lost, or until the time is up
-  // (false). False at once on the client's own thread, and when the client is being destroyed.
+  // Blocks until everything handed over before has been answered or lost. Returns false after the
+  // time-out, at once on the client's own thread, and when the client is being destroyed.
   bool flush(std::chrono::milliseconds timeout);
+  // True while a connection to the service exists. Never blocks.
   [[nodiscard]] bool isConnected() const;
-  // The socket of the present or last connection; empty before the first one.
+  // The socket of the current or last connection; empty before the first one.
   [[nodiscard]] std::string socketPath() const;
   [[nodiscard]] Counters counters() const;
-  // Called on the client's thread whenever the connection is made (true) or lost (false), and soon
-  // with true when it is made already. An empty one ends that, except for a call that is under way;
-  // none comes after the client's destruction.
+  // Sets the function to call when the connection is made (true) or lost (false). If there is a
+  // connection already, it is called soon with true. An empty function removes the handler. The
+  // handler runs on the client's thread, which sends nothing meanwhile; it must not block or
+  // destroy the client. A call that is running while the handler is replaced may end after this
+  // function has returned. No call comes after the client's destruction.
   void setConnectionHandler(std::function<void(bool connected)> handler);
 
  private:
@@ -127,40 +137,49 @@ class HalvoxClient {
   std::unique_ptr<Impl> impl_;
 };
 
-// One connection that asks and waits, for tools: each operation sends one request and returns its
-// answer. Belongs to one thread. Does not reconnect.
+// A connection for tools: each operation sends one request, blocks for the answer at most for the
+// time-out of open(), and returns it. Belongs to one thread. Does not reconnect: after the
+// connection has ended, every request fails with kNoService. Destruction closes the connection, and
+// the service then ends its sessions.
+//
+// The service answers requests about sessions that it does not know without an error, with true or
+// with default values.
 class HalvoxConnection {
  public:
-  // Connects to the socket (empty: as in Options) or says why it cannot, naming every place that
-  // was tried.
+  // Connects to a socket; an empty path stands for the usual places as in Options. The failure
+  // names every place that was tried. Blocks for at most `timeout`.
   static Result<std::unique_ptr<HalvoxConnection>> open(
       const std::string& socketPath, std::chrono::milliseconds timeout = std::chrono::seconds(5));
   ~HalvoxConnection();
   HalvoxConnection(const HalvoxConnection&) = delete;
   HalvoxConnection& operator=(const HalvoxConnection&) = delete;
 
-  // The socket it is connected to.
+  // The socket of this connection.
   [[nodiscard]] const std::string& socketPath() const;
-  // Sockets of places before that, which are there but which nobody serves.
+  // Sockets that were tried before it, which exist but which nobody serves.
   [[nodiscard]] std::vector<std::string> unservedSockets() const;
 
   Result<bool> createReportingSession(ReporterID id);
   Result<bool> setServiceType(ServiceType type, ReporterID id);
+  // The service type of a session, in spite of the name; 65535 for an unknown session.
   Result<ServiceType> getServiceNameForReporterID(ReporterID id);
   Result<bool> setConfiguration(const Dictionary& configuration, ReporterID id);
-  // The service answers a start when the session is stopped, so this does not wait for it: it
-  // returns once the service has carried the start out (a query behind it has been answered).
+  // Returns when the service has carried the start out. The answer itself comes at the stop, so
+  // this sends a query after the start and waits for the answer to that.
   Result<bool> startReportingSessionForID(ReporterID id);
-  // Waits for the answer to the last start of that session, at most for the time-out.
+  // Blocks until the last start of that session is answered, at most for `timeout`.
   Result<bool> waitForStartReply(ReporterID id, std::chrono::milliseconds timeout);
+  // Without a list of IDs the message is for all started sessions.
   Result<bool> sendMessage(const Dictionary& message, Category category, EventType type,
                            const std::optional<std::vector<ReporterID>>& ids);
   Result<bool> stopReportingSessionForID(ReporterID id);
   Result<bool> destroyReportingSession(ReporterID id);
+  // "reporterID" and "serviceType" of a session; 0 and 65535 for an unknown one.
   Result<Dictionary> reporterIDValid(ReporterID id);
+  // The IDs of the sessions of all clients.
   Result<std::vector<ReporterID>> getAllReporters();
-  // The service ends without an answer; true when the connection ended. Refused unless this process
-  // is root's or that of the user whom the service runs as.
+  // Ends the service. It does not answer; true means that the connection ended. Only root and the
+  // user that the service runs as may do this; others are refused.
   Result<bool> killService();
 
  private:
@@ -169,9 +188,9 @@ class HalvoxConnection {
   std::unique_ptr<Impl> impl_;
 };
 
-// Where a client with default settings looks for the service now: $HALVOX_SOCKET, else
+// Returns where a client with default options looks for the service now: $HALVOX_SOCKET, else
 // $XDG_RUNTIME_DIR/halvox/reporting.sock if that exists, else /run/halvox/reporting.sock if that
-// exists, else the first of these that is set. Does not connect.
+// exists, else the first of these that is defined. Does not connect.
 std::string defaultSocketPath();
 
 }  // namespace halvox::client

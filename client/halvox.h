@@ -16,19 +16,24 @@
  *   ...
  *   halvox_client_free(client);
  *
- * A client has one thread of its own that does all the talking. When the service goes away it waits
- * for it to come back, connects again and makes its sessions again; messages wait meanwhile, up to
- * the bounds in the options. A client does not work in a process that was forked off its own.
+ * A client has one thread of its own, which exchanges all messages with the service. If the service
+ * ends, the client waits for a new one, connects to it and makes its sessions again. Messages wait
+ * meanwhile, up to the bounds in halvox_options. After fork(), a client works only in the process
+ * that made it.
  *
- * Threads: any thread may use a client, except that halvox_client_free() must be the last to.
- * A dictionary or an array may be read by several threads at once (sending it is reading), but be
- * changed by one only, while no other reads it.
+ * Threads: any thread may call any function on a client. halvox_client_free() must be the last
+ * call. Several threads may read a dictionary or an array at the same time; sending it counts as
+ * reading. While one thread changes it, no other thread may use it.
  *
- * Ownership: what a function named ..._new gives is released with the ..._free of the same kind,
- * which takes NULL too. Everything else that is handed to a function is copied before it returns;
- * for dictionaries and arrays that is a reference count, not their content.
+ * Ownership: release the result of a ..._new function with the ..._free function of the same kind;
+ * these accept NULL and do nothing. Functions copy all other arguments before they return. For
+ * dictionaries and arrays that is a reference count, not their content.
  *
- * Texts end with a NUL and are UTF-8. */
+ * Errors: functions that can fail return a halvox_result, or NULL or false as their comment says.
+ * Passing NULL where a client, dictionary or array is needed is HALVOX_BAD_ARGUMENT, never a crash.
+ * A failed call changes nothing.
+ *
+ * Texts are UTF-8 and end with a NUL. Times are in milliseconds if the name ends in _ms. */
 
 #include <stdbool.h>
 #include <stddef.h>
@@ -44,24 +49,29 @@ extern "C" {
 #define HALVOX_API
 #endif
 
+/* A connection to the service, with its own thread and sessions. */
 typedef struct halvox_client halvox_client;
+/* Values under text keys: a message or a configuration. A key occurs once. */
 typedef struct halvox_dictionary halvox_dictionary;
+/* A list of values, which may be of different types. */
 typedef struct halvox_array halvox_array;
 
+/* The outcome of a call. */
 typedef enum halvox_result {
   HALVOX_OK = 0,
-  HALVOX_DROPPED = 1,      /* the message was not taken: too much is waiting; it is counted */
-  HALVOX_TIMED_OUT = 2,    /* the time was up first */
-  HALVOX_BAD_ARGUMENT = 3, /* NULL where something is needed, or a text that is not UTF-8 */
-  HALVOX_NO_MEMORY = 4
+  HALVOX_DROPPED = 1,      /* message not accepted: a bound of halvox_options is reached; counted */
+  HALVOX_TIMED_OUT = 2,    /* not finished within the given time */
+  HALVOX_BAD_ARGUMENT = 3, /* NULL where an object is needed, or a text that is not UTF-8 */
+  HALVOX_NO_MEMORY = 4     /* no memory, or no thread for a new client */
 } halvox_result;
 
-/* A few words on a result; never NULL. */
+/* Returns a short English description of a result, never NULL. The text is static. */
 HALVOX_API const char* halvox_result_text(halvox_result result);
 
 /* ---- The numbers of the protocol ------------------------------------------------------------ */
 
-/* A category is one of these, or one of these and a domain together (|). */
+/* What a message is about. A category is one of these numbers, optionally combined with one domain
+ * by the operator |. */
 enum {
   HALVOX_CATEGORY_GENERIC = 1,
   HALVOX_CATEGORY_RECORD = 2,
@@ -80,7 +90,8 @@ enum {
   HALVOX_CATEGORY_HEARING_HEALTH = 15
 };
 
-/* No enumeration: in C its constants are signed and the last of these does not fit. */
+/* The part of the audio system that a message comes from. These are macros because the constants of
+ * a C enumeration are signed, and the last one would not fit. */
 #define HALVOX_DOMAIN_MIDI UINT32_C(0x04000000)
 #define HALVOX_DOMAIN_SESSION UINT32_C(0x08000000)
 #define HALVOX_DOMAIN_DSP UINT32_C(0x10000000)
@@ -88,6 +99,7 @@ enum {
 #define HALVOX_DOMAIN_ROUTING UINT32_C(0x40000000)
 #define HALVOX_DOMAIN_TOOLBOX UINT32_C(0x80000000)
 
+/* What happened: the type of a message. */
 enum {
   HALVOX_EVENT_START = 1,
   HALVOX_EVENT_STOP = 2,
@@ -110,6 +122,7 @@ enum {
   HALVOX_EVENT_UNKNOWN = 65535
 };
 
+/* What kind of audio a session is for: its service type. */
 enum {
   HALVOX_SERVICE_GENERIC = 0,
   HALVOX_SERVICE_QUILLO = 1,
@@ -128,27 +141,37 @@ enum {
   HALVOX_SERVICE_UNKNOWN = 65535
 };
 
-/* The name of a category, such as "Session_Playback", into a buffer that snprintf() would fill:
- * what has no room is cut off, and the full length is returned. A size of 0 only measures. */
+/* Writes the name of a category, such as "Session_Playback", into a buffer of `size` bytes, as
+ * snprintf() does: always ends it with a NUL, cuts a name that is too long, and returns the length
+ * of the whole name without the NUL. With a size of 0 it only returns the length, and `buffer` may
+ * be NULL. A category without a name is "Undefined", after its domain if it has one. */
 HALVOX_API size_t halvox_category_name(uint32_t category, char* buffer, size_t size);
-/* The names of the others; they live as long as the program. */
+/* Return the name of an event type or a service type, such as "Start" or "telephony". The texts are
+ * static. Types without a name give "Generic", service types without one give "telephony", as in
+ * the service. */
 HALVOX_API const char* halvox_event_type_name(uint16_t type);
 HALVOX_API const char* halvox_service_type_name(uint16_t type);
 
-/* The number of a name, in any case of letters; false, and nothing stored, for an unknown one. */
+/* Look up the number of a name, in upper or lower case, and store it. Return false and store
+ * nothing if the name is unknown or an argument is NULL. */
 HALVOX_API bool halvox_find_category(const char* name, uint32_t* category);
 HALVOX_API bool halvox_find_event_type(const char* name, uint16_t* type);
 HALVOX_API bool halvox_find_service_type(const char* name, uint16_t* type);
 
 /* ---- Values --------------------------------------------------------------------------------- */
 
-/* An empty dictionary; NULL without memory. */
+/* Makes an empty dictionary. The caller owns it and releases it with halvox_dictionary_free().
+ * Returns NULL if there is no memory. */
 HALVOX_API halvox_dictionary* halvox_dictionary_new(void);
+/* Releases a dictionary. Messages and containers that hold its content are not affected. */
 HALVOX_API void halvox_dictionary_free(halvox_dictionary* dictionary);
+/* Returns the number of keys; 0 for NULL. */
 HALVOX_API size_t halvox_dictionary_count(const halvox_dictionary* dictionary);
 
-/* Each sets the value under a key, in the place of an old one. On failure nothing is changed.
- * A date counts the seconds since 1970-01-01 00:00 UTC. */
+/* Set the value of a key, and replace its old value if there is one. The key and the value are
+ * copied. Return HALVOX_BAD_ARGUMENT if `dictionary` or `key` is NULL, or if the key or a string
+ * value is not UTF-8; HALVOX_NO_MEMORY if there is no memory. Data of 0 bytes may be NULL. A date
+ * is in seconds since 1970-01-01 00:00 UTC. */
 HALVOX_API halvox_result halvox_dictionary_set_int64(halvox_dictionary* dictionary, const char* key,
                                                      int64_t value);
 HALVOX_API halvox_result halvox_dictionary_set_uint64(halvox_dictionary* dictionary,
@@ -163,20 +186,25 @@ HALVOX_API halvox_result halvox_dictionary_set_data(halvox_dictionary* dictionar
                                                     const void* bytes, size_t size);
 HALVOX_API halvox_result halvox_dictionary_set_date(halvox_dictionary* dictionary, const char* key,
                                                     double seconds_since_1970);
-/* The inner one is taken as it is now: changing it later changes nothing in the outer one. */
+/* The inner container is stored as it is now: later changes to it do not change the outer one. */
 HALVOX_API halvox_result halvox_dictionary_set_dictionary(halvox_dictionary* dictionary,
                                                           const char* key,
                                                           const halvox_dictionary* value);
 HALVOX_API halvox_result halvox_dictionary_set_array(halvox_dictionary* dictionary, const char* key,
                                                      const halvox_array* value);
-/* False when there was no such key. */
+/* Removes a key. Returns false if there was no such key, or if there was no memory for the change.
+ */
 HALVOX_API bool halvox_dictionary_remove(halvox_dictionary* dictionary, const char* key);
 
-/* An empty array; NULL without memory. */
+/* Makes an empty array. The caller owns it and releases it with halvox_array_free(). Returns NULL
+ * if there is no memory. */
 HALVOX_API halvox_array* halvox_array_new(void);
+/* Releases an array. Containers that hold its content are not affected. */
 HALVOX_API void halvox_array_free(halvox_array* array);
+/* Returns the number of values; 0 for NULL. */
 HALVOX_API size_t halvox_array_count(const halvox_array* array);
-/* Each appends one value. */
+/* Append one value. Units, copies and errors are those of the halvox_dictionary_set_...()
+ * functions. */
 HALVOX_API halvox_result halvox_array_append_int64(halvox_array* array, int64_t value);
 HALVOX_API halvox_result halvox_array_append_uint64(halvox_array* array, uint64_t value);
 HALVOX_API halvox_result halvox_array_append_double(halvox_array* array, double value);
@@ -191,83 +219,114 @@ HALVOX_API halvox_result halvox_array_append_array(halvox_array* array, const ha
 
 /* ---- The client ----------------------------------------------------------------------------- */
 
-/* How a client works. Set `size` to sizeof(halvox_options) and the rest to 0 for the defaults;
- * fields that a later version adds are then defaults too. */
+/* How a client works. Set `size` to sizeof(halvox_options) and all other fields to 0 for their
+ * defaults. `size` tells the library which fields this program knows: fields that a later version
+ * adds then have their defaults. */
 typedef struct halvox_options {
   size_t size;
-  const char* socket_path;       /* NULL: the usual places, see below */
-  uint64_t max_pending_messages; /* what may wait for the client's thread; 0: 8192 */
-  uint64_t max_pending_bytes;    /* 0: 8 MiB */
+  const char* socket_path;       /* NULL: the usual places, see halvox_default_socket_path() */
+  uint64_t max_pending_messages; /* messages that may wait for the client's thread; 0: 8192 */
+  uint64_t max_pending_bytes;    /* their size in memory; 0: 8 MiB */
   uint32_t request_timeout_ms;   /* how long making a connection may take; 0: 5000 */
-  uint32_t reconnect_min_ms;     /* first and longest pause between attempts to connect; */
-  uint32_t reconnect_max_ms;     /* 0: 50 and 2000 */
+  uint32_t reconnect_min_ms;     /* first pause between attempts to connect; 0: 50 */
+  uint32_t reconnect_max_ms;     /* longest pause, after several attempts; 0: 2000 */
 } halvox_options;
 
-/* What became of the messages: accepted = acknowledged + refused + lost + pending. */
+/* How many messages have had which outcome: accepted = acknowledged + refused + lost + pending. */
 typedef struct halvox_counters {
   size_t size;           /* set it to sizeof(halvox_counters) before the call */
-  uint64_t accepted;     /* taken by a send */
-  uint64_t dropped;      /* not taken */
-  uint64_t acknowledged; /* answered by the service */
-  uint64_t refused;      /* answered with an error, or without a form on the wire */
-  uint64_t lost;         /* in flight when a connection ended: the service may have had them */
+  uint64_t accepted;     /* a send function returned HALVOX_OK */
+  uint64_t dropped;      /* a send function returned HALVOX_DROPPED */
+  uint64_t acknowledged; /* answered by the service without an error */
+  uint64_t refused;      /* answered with an error, or not representable on the wire */
+  uint64_t lost;         /* in flight when a connection ended; the service may have received them.
+                            Also messages that waited when 8,192 session operations had piled up
+                            without a service */
   uint64_t pending;      /* waiting or in flight */
-  uint64_t reconnects;
+  uint64_t reconnects;   /* connections made after the first one */
 } halvox_counters;
 
-/* Called on the client's thread. It must not call halvox_client_free(). */
+/* Called when the connection is made (true) or lost (false), on the client's thread, which sends
+ * nothing until the handler returns. It must not block or call halvox_client_free(). */
 typedef void (*halvox_connection_handler)(bool connected, void* user_data);
 
-/* Where a client with default options looks for the service now: $HALVOX_SOCKET when it is set,
- * else the user's place, $XDG_RUNTIME_DIR/halvox/reporting.sock, when that exists, else the
- * system's, /run/halvox/reporting.sock, when that exists, else the first of these that is set. A
- * client goes on to the next place when nobody serves a socket, and looks again at each attempt;
- * one whose connection ended waits for 10 seconds at the same place before it looks elsewhere.
- * Fills the buffer as halvox_category_name() does. */
+/* Writes the path of the socket where a client with default options looks for the service now:
+ *
+ *   1. $HALVOX_SOCKET, if it is set;
+ *   2. the user's service, $XDG_RUNTIME_DIR/halvox/reporting.sock, if it exists;
+ *   3. the system's service, /run/halvox/reporting.sock, if it exists;
+ *   4. otherwise the first of these places that is defined.
+ *
+ * A client itself also goes on to the next place if nobody serves a socket, and looks again at each
+ * attempt. After its connection ended, it tries only the same place for 10 seconds: a service that
+ * is being restarted must not lose its clients to another one. Fills the buffer and returns the
+ * length as halvox_category_name() does. */
 HALVOX_API size_t halvox_default_socket_path(char* buffer, size_t size);
 
-/* Starts a client, at once and whether there is a service or not. NULL for the options: all
- * defaults. NULL comes back when there is no memory or no thread to be had. */
+/* Starts a client with its thread. Does not wait for the service, and succeeds without one.
+ * `options` may be NULL for all defaults. The caller owns the client and releases it with
+ * halvox_client_free(). Returns NULL if there is no memory or no thread. */
 HALVOX_API halvox_client* halvox_client_new(const halvox_options* options);
-/* Delivers what is pending for at most a second, then ends the client and its sessions. */
+/* Delivers pending messages for at most one second if the service is there, then ends the client,
+ * its thread and its sessions. Blocks meanwhile. No call on this client may run or follow. */
 HALVOX_API void halvox_client_free(halvox_client* client);
 
-/* The steps of a session's life. They are handed over and return at once, in order with the
- * messages; HALVOX_OK says that they were handed over. The service answers none of them with an
- * error when it knows no such session. */
+/* The steps of a session's life. `id` is a reporter ID, a number that the program chooses; 0 means
+ * no session. The calls hand the step to the client's thread and return at once. Steps and messages
+ * of one thread are carried out in the order of the calls. HALVOX_OK means that the step was handed
+ * over. The service reports no error for a session that it does not know, so a step for one has no
+ * effect. These functions may wait for a lock for a moment and may allocate. */
+/* Makes a session, in place of an older one of this client with the same ID. */
 HALVOX_API halvox_result halvox_client_create_session(halvox_client* client, int64_t id);
+/* Says what kind of audio the session is for: a HALVOX_SERVICE_... number. */
 HALVOX_API halvox_result halvox_client_set_service_type(halvox_client* client, int64_t id,
                                                         uint16_t service_type);
-/* Merged with what the session's configuration has already. */
+/* Merges a dictionary into the session's configuration: its keys replace equal ones. */
 HALVOX_API halvox_result halvox_client_set_configuration(halvox_client* client, int64_t id,
                                                          const halvox_dictionary* configuration);
+/* Starts reporting for the session. The service answers a start only at the stop; the client does
+ * not wait for that. */
 HALVOX_API halvox_result halvox_client_start(halvox_client* client, int64_t id);
+/* Stops the session, which may be started again. */
 HALVOX_API halvox_result halvox_client_stop(halvox_client* client, int64_t id);
+/* Removes the session, and stops it first if it runs. */
 HALVOX_API halvox_result halvox_client_destroy_session(halvox_client* client, int64_t id);
 
-/* Hand one message over: HALVOX_OK or HALVOX_DROPPED. None of them blocks, takes a lock or makes a
- * request, so an audio thread may call them; with a dictionary made beforehand, the first and the
- * last allocate nothing either. */
+/* Hand one message to the client's thread, for one session, which may be another client's. Returns
+ * HALVOX_OK, or HALVOX_DROPPED if a bound of halvox_options is reached or the client is ending;
+ * halvox_client_counters() counts both. `category` is a HALVOX_CATEGORY_... number, optionally with
+ * a domain, `type` is a HALVOX_EVENT_... number.
+ *
+ * An audio thread may call the send functions: they never block, take a lock or wait for the
+ * service. With a dictionary made in advance, halvox_client_send() and halvox_client_send_to_all()
+ * do not allocate either. They make one system call if the client's thread is asleep. */
 HALVOX_API halvox_result halvox_client_send(halvox_client* client, int64_t id,
                                             const halvox_dictionary* message, uint32_t category,
                                             uint16_t type);
-/* To several sessions; with a count of 0 the service takes the message and gives it to none. */
+/* The same for several sessions; allocates for the list. With a count of 0 the service accepts the
+ * message and gives it to no session; `ids` may then be NULL. */
 HALVOX_API halvox_result halvox_client_send_to(halvox_client* client, const int64_t* ids,
                                                size_t count, const halvox_dictionary* message,
                                                uint32_t category, uint16_t type);
-/* To all active sessions of all programs. */
+/* The same for all started sessions of all programs. */
 HALVOX_API halvox_result halvox_client_send_to_all(halvox_client* client,
                                                    const halvox_dictionary* message,
                                                    uint32_t category, uint16_t type);
 
-/* Waits until everything handed over before has been answered; HALVOX_TIMED_OUT when it has not
- * been in that time, and at once when called from the connection handler. */
+/* Blocks until everything handed over before has been answered or lost. Returns HALVOX_TIMED_OUT
+ * after `timeout_ms`, and at once if it is called from the connection handler, whose thread would
+ * have to do the work. */
 HALVOX_API halvox_result halvox_client_flush(halvox_client* client, uint32_t timeout_ms);
+/* Returns true while a connection to the service exists. Never blocks. */
 HALVOX_API bool halvox_client_is_connected(const halvox_client* client);
+/* Stores the counters of this moment. Set `counters->size` first: only fields within that size are
+ * written. Never blocks. */
 HALVOX_API halvox_result halvox_client_counters(const halvox_client* client,
                                                 halvox_counters* counters);
-/* Calls the handler whenever the connection is made or lost, and soon if it is made already.
- * NULL ends that; a call that is under way may still come to its end afterwards. */
+/* Sets the function to call when the connection is made or lost. If there is a connection already,
+ * the handler is called soon with true. Replaces an earlier handler; NULL removes it. A call that
+ * is running when the handler is replaced may end after this function has returned, so `user_data`
+ * must live on until then, at the latest until halvox_client_free() returns. */
 HALVOX_API halvox_result halvox_client_set_connection_handler(halvox_client* client,
                                                               halvox_connection_handler handler,
                                                               void* user_data);
