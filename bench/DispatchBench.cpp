@@ -8,7 +8,7 @@
 #include <benchmark/benchmark.h>
 
 #include "platform/linux/dispatch/AsioDispatchService.h"
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 
 namespace {
@@ -17,7 +17,7 @@ using namespace halvox::platform;
 
 struct Fixture {
   linux_::CounterStatisticsService statistics;
-  linux_::SpdlogLogService log{LogLevel::kError, linux_::makeTextLogSink(2), statistics};
+  linux_::QueuedLogService log{LogLevel::kError, linux_::makeTextLogSink(2), statistics};
   linux_::AsioDispatchService service{log, statistics};
   std::shared_ptr<DispatchQueue> queue = service.createSerialQueue(
       "com.tarno.halvox.bench", QualityOfService::kUserInteractive, QueueThreading::kOwnThread);

@@ -17,7 +17,7 @@
 #include <vector>
 
 #include "platform/linux/dispatch/AsioDispatchService.h"
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 
 namespace {
@@ -124,7 +124,7 @@ void print(const std::vector<Kind>& kinds) {
 int main(int argumentCount, char** arguments) {
   const int rounds = argumentCount > 1 ? std::max(std::atoi(arguments[1]), 1) : kDefaultRounds;
   linux_::CounterStatisticsService statistics;
-  linux_::SpdlogLogService log{LogLevel::kError, linux_::makeTextLogSink(2), statistics};
+  linux_::QueuedLogService log{LogLevel::kError, linux_::makeTextLogSink(2), statistics};
   linux_::AsioDispatchService service{log, statistics};
   const auto requests = service.createSerialQueue(
       "com.tarno.halvox.requests", QualityOfService::kUserInteractive, QueueThreading::kOwnThread);

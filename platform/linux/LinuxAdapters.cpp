@@ -74,7 +74,7 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
           }(),
           backpressure),
       kdebug(makeKdebug(kdebugFailure)),
-      log(SpdlogLogService::onStandardError({configuration.logLevel, configuration.logMemoryLevel},
+      log(QueuedLogService::onStandardError({configuration.logLevel, configuration.logMemoryLevel},
                                             statistics)),
       // Its last line tells why the process ended.
       process([this] { log->stop(); }),

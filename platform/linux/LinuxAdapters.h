@@ -19,7 +19,7 @@
 #include "platform/linux/link/local/LocalTlmReportingService.h"
 #include "platform/linux/link/local/NoneTlmReportingService.h"
 #include "platform/linux/link/nats/NatsTlmReporting.h"
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/linux/runtime/LibcClockService.h"
 #include "platform/linux/runtime/ProcfsProcessService.h"
@@ -57,7 +57,7 @@ struct LinuxAdapters {
   LinuxConnectionService connections;
   std::string kdebugFailure;
   std::unique_ptr<KdebugService> kdebug;
-  std::unique_ptr<SpdlogLogService> log;
+  std::unique_ptr<QueuedLogService> log;
   LibcClockService clock;
   ProcfsProcessService process;
   ConfiguredDevicePropertyService deviceProperties;

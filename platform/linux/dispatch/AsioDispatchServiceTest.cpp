@@ -18,7 +18,7 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/linux/testing/WaitFor.h"
@@ -31,7 +31,7 @@ class AsioDispatchServiceTest : public ::testing::Test {
   AsioDispatchServiceTest() {
     auto sink = std::make_unique<MemoryLogSink>();
     sink_ = sink.get();
-    log_ = std::make_unique<SpdlogLogService>(LogLevel::kDebug, std::move(sink), statistics_);
+    log_ = std::make_unique<QueuedLogService>(LogLevel::kDebug, std::move(sink), statistics_);
     service_ = std::make_unique<AsioDispatchService>(*log_, statistics_);
   }
 
@@ -50,7 +50,7 @@ class AsioDispatchServiceTest : public ::testing::Test {
 
   CounterStatisticsService statistics_;
   MemoryLogSink* sink_ = nullptr;
-  std::unique_ptr<SpdlogLogService> log_;
+  std::unique_ptr<QueuedLogService> log_;
   std::unique_ptr<AsioDispatchService> service_;
 };
 

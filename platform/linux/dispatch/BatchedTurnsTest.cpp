@@ -8,7 +8,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/linux/dispatch/AsioDispatchService.h"
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/linux/testing/WaitFor.h"
@@ -41,7 +41,7 @@ class BatchedTurnsTest : public ::testing::Test {
   }
 
   CounterStatisticsService statistics_;
-  SpdlogLogService log_{LogLevel::kError, std::make_unique<MemoryLogSink>(), statistics_};
+  QueuedLogService log_{LogLevel::kError, std::make_unique<MemoryLogSink>(), statistics_};
   AsioDispatchService service_{log_, statistics_};
 };
 

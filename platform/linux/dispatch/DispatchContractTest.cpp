@@ -5,7 +5,7 @@
 
 #include "platform/fake/contracts/DispatchWaitContract.h"
 #include "platform/linux/dispatch/AsioDispatchService.h"
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/linux/testing/WaitFor.h"
@@ -21,7 +21,7 @@ class AsioHarness {
 
  private:
   linux_::CounterStatisticsService statistics_;
-  linux_::SpdlogLogService log_{LogLevel::kError, std::make_unique<linux_::MemoryLogSink>(),
+  linux_::QueuedLogService log_{LogLevel::kError, std::make_unique<linux_::MemoryLogSink>(),
                                 statistics_};
   linux_::AsioDispatchService service_{log_, statistics_};
 };

@@ -15,7 +15,7 @@
 #include <unistd.h>
 
 #include "platform/linux/dispatch/AsioDispatchService.h"
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/linux/testing/WaitFor.h"
@@ -57,7 +57,7 @@ class HelpingTest : public ::testing::Test {
 
   const std::thread::id self_ = std::this_thread::get_id();
   CounterStatisticsService statistics_;
-  SpdlogLogService log_{LogLevel::kError, std::make_unique<MemoryLogSink>(), statistics_};
+  QueuedLogService log_{LogLevel::kError, std::make_unique<MemoryLogSink>(), statistics_};
   AsioDispatchService service_{log_, statistics_};
 };
 

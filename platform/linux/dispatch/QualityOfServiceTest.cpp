@@ -16,7 +16,7 @@
 #include <unistd.h>
 
 #include "platform/linux/dispatch/AsioDispatchService.h"
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/linux/testing/NoThreadsToHave.h"
@@ -48,7 +48,7 @@ class QualityOfServiceTest : public ::testing::Test {
   QualityOfServiceTest() {
     auto sink = std::make_unique<MemoryLogSink>();
     sink_ = sink.get();
-    log_ = std::make_unique<SpdlogLogService>(LogLevel::kDebug, std::move(sink), statistics_);
+    log_ = std::make_unique<QueuedLogService>(LogLevel::kDebug, std::move(sink), statistics_);
     service_ = std::make_unique<AsioDispatchService>(*log_, statistics_);
   }
 
@@ -73,7 +73,7 @@ class QualityOfServiceTest : public ::testing::Test {
 
   CounterStatisticsService statistics_;
   MemoryLogSink* sink_ = nullptr;
-  std::unique_ptr<SpdlogLogService> log_;
+  std::unique_ptr<QueuedLogService> log_;
   std::unique_ptr<AsioDispatchService> service_;
 };
 

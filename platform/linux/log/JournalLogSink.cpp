@@ -9,6 +9,7 @@
 #include <sys/stat.h>
 #include <syslog.h>
 
+#include "platform/linux/log/LogLineFormatter.h"
 #include "platform/linux/log/LogSink.h"
 
 namespace halvox::platform::linux_ {
@@ -42,8 +43,10 @@ class JournalLogSink final : public LogSink {
 
  private:
   bool send(const LogEntry& entry) {
+    std::string message = "MESSAGE=";
+    appendLogLineText(message, entry);
     std::array<std::string, 4> fields{
-        "MESSAGE=" + logLineText(entry),
+        std::move(message),
         "PRIORITY=" + std::to_string(priority(entry.level)),
         "HALVOX_SUBSYSTEM=" + std::string(entry.subsystem),
         "HALVOX_CATEGORY=" + std::string(entry.category),

@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 
@@ -12,12 +12,12 @@ namespace halvox::platform::contract {
 
 namespace adapters {
 
-class SpdlogHarness {
+class QueuedHarness {
  public:
-  explicit SpdlogHarness(LogLevel threshold) {
+  explicit QueuedHarness(LogLevel threshold) {
     auto sink = std::make_unique<linux_::MemoryLogSink>();
     sink_ = sink.get();
-    service_ = std::make_unique<linux_::SpdlogLogService>(threshold, std::move(sink), statistics_);
+    service_ = std::make_unique<linux_::QueuedLogService>(threshold, std::move(sink), statistics_);
   }
   LogService& service() { return *service_; }
   std::vector<std::string> lines() {
@@ -28,11 +28,11 @@ class SpdlogHarness {
  private:
   linux_::CounterStatisticsService statistics_;
   linux_::MemoryLogSink* sink_ = nullptr;
-  std::unique_ptr<linux_::SpdlogLogService> service_;
+  std::unique_ptr<linux_::QueuedLogService> service_;
 };
 
 }  // namespace adapters
 
-INSTANTIATE_TYPED_TEST_SUITE_P(Spdlog, LogContract, adapters::SpdlogHarness);
+INSTANTIATE_TYPED_TEST_SUITE_P(Queued, LogContract, adapters::QueuedHarness);
 
 }  // namespace halvox::platform::contract

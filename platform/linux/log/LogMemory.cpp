@@ -2,7 +2,7 @@
 
 #include <algorithm>
 
-#include "platform/linux/log/LogSink.h"
+#include "platform/linux/log/LogLineFormatter.h"
 
 namespace halvox::platform::linux_ {
 

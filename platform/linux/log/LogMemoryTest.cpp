@@ -7,7 +7,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include "platform/linux/log/LogSink.h"
+#include "platform/linux/log/LogLineFormatter.h"
 
 namespace halvox::platform::linux_ {
 namespace {

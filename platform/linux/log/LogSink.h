@@ -3,17 +3,12 @@
 #include <functional>
 #include <memory>
 #include <span>
-#include <string>
-#include <string_view>
 
 #include <sys/uio.h>
 
 #include "platform/linux/log/LogQueue.h"
 
 namespace halvox::platform::linux_ {
-
-// Longest line that a sink is given; the rest is told in numbers.
-inline constexpr std::size_t kLongestLogLine = 8192;
 
 // Takes lines from the thread that writes the log.
 class LogSink {
@@ -23,27 +18,6 @@ class LogSink {
   // reader until finish() is called from another thread, and about a second after that.
   virtual std::size_t write(std::span<const LogEntry> entries) = 0;
   virtual void finish() = 0;
-};
-
-// The line of an entry: escaped, so that it is one line, and bounded.
-std::string logLineText(const LogEntry& entry);
-
-// Entries as lines of text, each with its end:
-//   2024-05-01T12:00:00.123+02:00 error [com.tarno.halvox:hvrs] the line
-// Belongs to one thread.
-class LogLineFormatter {
- public:
-  LogLineFormatter();
-  ~LogLineFormatter();
-  LogLineFormatter(const LogLineFormatter&) = delete;
-  LogLineFormatter& operator=(const LogLineFormatter&) = delete;
-
-  // Valid until the next call.
-  [[nodiscard]] std::string_view format(const LogEntry& entry);
-
- private:
-  struct Parts;
-  const std::unique_ptr<Parts> parts_;
 };
 
 // Lines of text on a descriptor, which is not owned.

@@ -1,6 +1,5 @@
 #include <algorithm>
 #include <array>
-#include <atomic>
 #include <cerrno>
 #include <chrono>
 #include <cstdint>
@@ -8,13 +7,11 @@
 #include <optional>
 
 #include <poll.h>
-#include <spdlog/pattern_formatter.h>
 #include <sys/eventfd.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include "platform/linux/base/UniqueHandle.h"
-#include "platform/linux/base/Utf8.h"
+#include "platform/linux/log/LogLineFormatter.h"
 #include "platform/linux/log/LogSink.h"
 
 namespace halvox::platform::linux_ {
@@ -26,46 +23,6 @@ using Clock = std::chrono::steady_clock;
 constexpr std::size_t kChunk = 4096;
 // How long lines may still wait for the reader when the log ends.
 constexpr std::chrono::milliseconds kLastWait{1000};
-
-std::string_view levelWord(spdlog::level::level_enum level) {
-  switch (level) {
-    case spdlog::level::debug:
-      return "debug";
-    case spdlog::level::info:
-      return "info";
-    case spdlog::level::err:
-      return "error";
-    default:
-      return "default";
-  }
-}
-
-spdlog::level::level_enum spdlogLevel(LogLevel level) {
-  switch (level) {
-    case LogLevel::kDebug:
-      return spdlog::level::debug;
-    case LogLevel::kInfo:
-      return spdlog::level::info;
-    case LogLevel::kDefault:
-      return spdlog::level::warn;
-    case LogLevel::kError:
-      return spdlog::level::err;
-  }
-  return spdlog::level::err;
-}
-
-// Our own words for the levels, which spdlog has no names for.
-class LevelFlag final : public spdlog::custom_flag_formatter {
- public:
-  void format(const spdlog::details::log_msg& message, const std::tm& /*time*/,
-              spdlog::memory_buf_t& out) override {
-    const std::string_view word = levelWord(message.level);
-    out.append(word.data(), word.data() + word.size());
-  }
-  [[nodiscard]] std::unique_ptr<spdlog::custom_flag_formatter> clone() const override {
-    return std::make_unique<LevelFlag>();
-  }
-};
 
 // Waits for its reader without a time-out, so that an idle or a stuck log costs nothing; an event
 // descriptor ends the wait. Belongs to the log's thread but for finish().
@@ -128,37 +85,6 @@ bool TextLogSink::waitForReader() {
 }
 
 }  // namespace
-
-struct LogLineFormatter::Parts {
-  Parts() { formatter.add_flag<LevelFlag>('*').set_pattern("%Y-%m-%dT%H:%M:%S.%e%z %* [%n] %v"); }
-
-  spdlog::pattern_formatter formatter;
-  spdlog::memory_buf_t line;
-};
-
-LogLineFormatter::LogLineFormatter() : parts_(std::make_unique<Parts>()) {}
-
-LogLineFormatter::~LogLineFormatter() = default;
-
-std::string_view LogLineFormatter::format(const LogEntry& entry) {
-  std::string name(entry.subsystem);
-  name += ':';
-  name += entry.category;
-  const std::string text = logLineText(entry);
-  parts_->line.clear();
-  parts_->formatter.format(
-      spdlog::details::log_msg(entry.time, {}, name, spdlogLevel(entry.level), text), parts_->line);
-  return {parts_->line.data(), parts_->line.size()};
-}
-
-std::string logLineText(const LogEntry& entry) {
-  std::string line;
-  const std::size_t taken = appendEscaped(line, entry.text, kLongestLogLine);
-  if (taken < entry.wholeLength) {
-    line += "… (" + std::to_string(entry.wholeLength - taken) + " bytes more)";
-  }
-  return line;
-}
 
 std::unique_ptr<LogSink> makeTextLogSink(int descriptor) {
   return std::make_unique<TextLogSink>(descriptor);

@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "platform/linux/base/Mutex.h"
+#include "platform/linux/log/LogLineFormatter.h"
 #include "platform/linux/log/LogSink.h"
 
 namespace halvox::platform::linux_ {
@@ -17,7 +18,7 @@ class MemoryLogSink final : public LogSink {
     isWriting_ = true;
     changed_.notifyAll();
     while (isHeld_) changed_.wait(mutex_);
-    for (const LogEntry& entry : entries) lines_.push_back(logLineText(entry));
+    for (const LogEntry& entry : entries) appendLogLineText(lines_.emplace_back(), entry);
     isWriting_ = false;
     return entries.size();
   }

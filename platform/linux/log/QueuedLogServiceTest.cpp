@@ -1,4 +1,4 @@
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 
 #include <array>
 #include <chrono>
@@ -16,6 +16,7 @@
 #include <unistd.h>
 
 #include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/log/LogLineFormatter.h"
 #include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 
@@ -47,10 +48,10 @@ struct Pipe {
   UniqueFd writer;
 };
 
-class SpdlogLogServiceTest : public ::testing::Test {
+class QueuedLogServiceTest : public ::testing::Test {
  protected:
-  SpdlogLogService& make(std::unique_ptr<LogSink> sink) {
-    service_ = std::make_unique<SpdlogLogService>(LogLevel::kDebug, std::move(sink), statistics_);
+  QueuedLogService& make(std::unique_ptr<LogSink> sink) {
+    service_ = std::make_unique<QueuedLogService>(LogLevel::kDebug, std::move(sink), statistics_);
     category_ = &service_->createCategory("com.tarno.halvox", "hvrs");
     return *service_;
   }
@@ -71,21 +72,21 @@ class SpdlogLogServiceTest : public ::testing::Test {
   std::uint64_t count(const char* name) { return statistics_.counter("log", name).value(); }
 
   CounterStatisticsService statistics_;
-  std::unique_ptr<SpdlogLogService> service_;
+  std::unique_ptr<QueuedLogService> service_;
   LogCategory* category_ = nullptr;
 };
 
-TEST_F(SpdlogLogServiceTest, LineHasTimeLevelNamesAndText) {
+TEST_F(QueuedLogServiceTest, LineHasTimeLevelNamesAndText) {
   EXPECT_THAT(writtenText(LogLevel::kError, "it broke"),
               MatchesRegex("[0-9]{4}-[0-9]{2}-[0-9]{2}T[0-9]{2}:[0-9]{2}:[0-9]{2}\\.[0-9]{3}"
                            "[+-][0-9]{2}:[0-9]{2} error \\[com\\.tarno\\.halvox:hvrs\\] it broke"
                            "\n"));
 }
 
-TEST_F(SpdlogLogServiceTest, KeepsLinesInMemoryAtALevelOfTheirOwn) {
+TEST_F(QueuedLogServiceTest, KeepsLinesInMemoryAtALevelOfTheirOwn) {
   auto sink = std::make_unique<MemoryLogSink>();
   MemoryLogSink& written = *sink;
-  SpdlogLogService service({LogLevel::kError, LogLevel::kInfo}, std::move(sink), statistics_);
+  QueuedLogService service({LogLevel::kError, LogLevel::kInfo}, std::move(sink), statistics_);
   LogCategory& category = service.createCategory("com.tarno.halvox", "hvrs");
   for (const auto& [level, text] :
        {std::pair(LogLevel::kDebug, "too little"), std::pair(LogLevel::kInfo, "kept"),
@@ -101,29 +102,29 @@ TEST_F(SpdlogLogServiceTest, KeepsLinesInMemoryAtALevelOfTheirOwn) {
   EXPECT_EQ(count("received"), 1U);
 }
 
-TEST_F(SpdlogLogServiceTest, LevelsHaveTheirOwnWords) {
+TEST_F(QueuedLogServiceTest, LevelsHaveTheirOwnWords) {
   EXPECT_THAT(writtenText(LogLevel::kDebug, "x"), HasSubstr(" debug ["));
   EXPECT_THAT(writtenText(LogLevel::kInfo, "x"), HasSubstr(" info ["));
   EXPECT_THAT(writtenText(LogLevel::kDefault, "x"), HasSubstr(" default ["));
 }
 
-TEST_F(SpdlogLogServiceTest, OneLineStaysOneLineWhateverItHolds) {
+TEST_F(QueuedLogServiceTest, OneLineStaysOneLineWhateverItHolds) {
   EXPECT_THAT(writtenText(LogLevel::kInfo, "a\nb\x1B[2J\xFF"), EndsWith("] a\\nb\\x1b[2J\\xff\n"));
 }
 
-TEST_F(SpdlogLogServiceTest, VeryLongLineIsCutAndSaysByHowMuch) {
+TEST_F(QueuedLogServiceTest, VeryLongLineIsCutAndSaysByHowMuch) {
   const std::string line = writtenText(LogLevel::kInfo, std::string(10'000, 'x'));
 
   EXPECT_THAT(line, EndsWith("] " + std::string(kLongestLogLine, 'x') + "… (1808 bytes more)\n"));
 }
 
-TEST_F(SpdlogLogServiceTest, EscapingDoesNotMakeALineLongerThanTheLimit) {
+TEST_F(QueuedLogServiceTest, EscapingDoesNotMakeALineLongerThanTheLimit) {
   const std::string line = writtenText(LogLevel::kInfo, std::string(10'000, '\n'));
 
   EXPECT_THAT(line, EndsWith("\\n\\n… (5904 bytes more)\n"));
 }
 
-TEST_F(SpdlogLogServiceTest, StuckReaderHoldsUpNobody) {
+TEST_F(QueuedLogServiceTest, StuckReaderHoldsUpNobody) {
   MemoryLogSink& sink = makeWithMemory();
   sink.hold();
   category_->write(LogLevel::kInfo, "first");
@@ -139,7 +140,7 @@ TEST_F(SpdlogLogServiceTest, StuckReaderHoldsUpNobody) {
   EXPECT_EQ(count("received"), count("delivered") + count("dropped: reader too slow"));
 }
 
-TEST_F(SpdlogLogServiceTest, ErrorsFindRoomWhenOtherLinesDoNot) {
+TEST_F(QueuedLogServiceTest, ErrorsFindRoomWhenOtherLinesDoNot) {
   MemoryLogSink& sink = makeWithMemory();
   sink.hold();
   category_->write(LogLevel::kInfo, "first");
@@ -155,7 +156,7 @@ TEST_F(SpdlogLogServiceTest, ErrorsFindRoomWhenOtherLinesDoNot) {
   EXPECT_THAT(sink.lines(), ::testing::Contains("it broke"));
 }
 
-TEST_F(SpdlogLogServiceTest, LossIsToldOnceThereIsRoom) {
+TEST_F(QueuedLogServiceTest, LossIsToldOnceThereIsRoom) {
   MemoryLogSink& sink = makeWithMemory();
   sink.hold();
   category_->write(LogLevel::kInfo, "first");
@@ -168,7 +169,7 @@ TEST_F(SpdlogLogServiceTest, LossIsToldOnceThereIsRoom) {
   EXPECT_THAT(sink.lines(), ::testing::Contains(HasSubstr(" lines were dropped")).Times(1));
 }
 
-TEST_F(SpdlogLogServiceTest, StopIsBoundedWhenThePipeIsNeverRead) {
+TEST_F(QueuedLogServiceTest, StopIsBoundedWhenThePipeIsNeverRead) {
   Pipe pipe;
   make(makeTextLogSink(pipe.writer.get()));
   for (int number = 0; number < 500; ++number) {
@@ -183,7 +184,7 @@ TEST_F(SpdlogLogServiceTest, StopIsBoundedWhenThePipeIsNeverRead) {
   EXPECT_EQ(count("received"), count("delivered") + count("dropped: not taken by the reader"));
 }
 
-TEST_F(SpdlogLogServiceTest, ReaderThatWentAwayDoesNotEndTheProcess) {
+TEST_F(QueuedLogServiceTest, ReaderThatWentAwayDoesNotEndTheProcess) {
   Pipe pipe;
   pipe.reader.reset();
   make(makeTextLogSink(pipe.writer.get()));
@@ -194,7 +195,7 @@ TEST_F(SpdlogLogServiceTest, ReaderThatWentAwayDoesNotEndTheProcess) {
   EXPECT_EQ(count("dropped: not taken by the reader"), 1U);
 }
 
-TEST_F(SpdlogLogServiceTest, LinesAfterTheStopAreDroppedAndCounted) {
+TEST_F(QueuedLogServiceTest, LinesAfterTheStopAreDroppedAndCounted) {
   makeWithMemory();
   service_->stop();
 
@@ -203,7 +204,7 @@ TEST_F(SpdlogLogServiceTest, LinesAfterTheStopAreDroppedAndCounted) {
   EXPECT_EQ(count("dropped: reader too slow"), 1U);
 }
 
-TEST_F(SpdlogLogServiceTest, JournalGetsFields) {
+TEST_F(QueuedLogServiceTest, JournalGetsFields) {
   std::vector<std::string> fields;
   make(makeJournalLogSink([&fields](const iovec* vectors, int size) {
     for (int index = 0; index < size; ++index) {
@@ -222,7 +223,7 @@ TEST_F(SpdlogLogServiceTest, JournalGetsFields) {
   EXPECT_EQ(count("delivered"), 1U);
 }
 
-TEST_F(SpdlogLogServiceTest, LineThatTheJournalRefusesCountsAsDropped) {
+TEST_F(QueuedLogServiceTest, LineThatTheJournalRefusesCountsAsDropped) {
   make(makeJournalLogSink([](const iovec*, int) { return -111; }));
 
   category_->write(LogLevel::kDefault, "x");

@@ -28,7 +28,7 @@ namespace halvox::platform::linux_ {
 // Beside that the newest lines stay in memory at a level of their own, for captures of diagnostics.
 //
 // Any thread may log. The categories live as long as the service, which main keeps to the end.
-class SpdlogLogService final : public LogService {
+class QueuedLogService final : public LogService {
  public:
   // The least level that is written, and the least that is kept in memory; none: nothing is kept.
   struct Levels {
@@ -39,11 +39,11 @@ class SpdlogLogService final : public LogService {
   };
 
   // Lines below both levels are not wanted. `statistics` must outlive the service.
-  SpdlogLogService(Levels levels, std::unique_ptr<LogSink> sink, StatisticsService& statistics);
+  QueuedLogService(Levels levels, std::unique_ptr<LogSink> sink, StatisticsService& statistics);
   // To standard error, or to the journal when that is where standard error goes.
-  static std::unique_ptr<SpdlogLogService> onStandardError(Levels levels,
+  static std::unique_ptr<QueuedLogService> onStandardError(Levels levels,
                                                            StatisticsService& statistics);
-  ~SpdlogLogService() override;
+  ~QueuedLogService() override;
 
   LogCategory& createCategory(std::string_view subsystem, std::string_view category) override;
 

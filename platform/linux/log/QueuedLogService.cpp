@@ -1,4 +1,4 @@
-#include "platform/linux/log/SpdlogLogService.h"
+#include "platform/linux/log/QueuedLogService.h"
 
 #include <algorithm>
 #include <vector>
@@ -7,13 +7,14 @@
 #include <unistd.h>
 
 #include "platform/linux/base/ThreadSetup.h"
+#include "platform/linux/log/LogLineFormatter.h"
 
 namespace halvox::platform::linux_ {
 
 // One category's face of the service.
-class SpdlogLogService::Category final : public LogCategory {
+class QueuedLogService::Category final : public LogCategory {
  public:
-  Category(SpdlogLogService& service, std::string subsystem, std::string category)
+  Category(QueuedLogService& service, std::string subsystem, std::string category)
       : LogCategory(std::min(service.levels_.written,
                              service.levels_.kept.value_or(service.levels_.written))),
         service_(service),
@@ -37,12 +38,12 @@ class SpdlogLogService::Category final : public LogCategory {
   }
 
  private:
-  SpdlogLogService& service_;
+  QueuedLogService& service_;
   const std::string subsystem_;
   const std::string category_;
 };
 
-SpdlogLogService::SpdlogLogService(Levels levels, std::unique_ptr<LogSink> sink,
+QueuedLogService::QueuedLogService(Levels levels, std::unique_ptr<LogSink> sink,
                                    StatisticsService& statistics)
     : levels_(levels),
       memory_(levels.kept.has_value() ? std::make_unique<LogMemory>(*levels.kept) : nullptr),
@@ -51,19 +52,19 @@ SpdlogLogService::SpdlogLogService(Levels levels, std::unique_ptr<LogSink> sink,
       written_(statistics.counter("log", "delivered")),
       dropped_(statistics.counter("log", "dropped: reader too slow")),
       failed_(statistics.counter("log", "dropped: not taken by the reader")),
-      thread_(&SpdlogLogService::run, this) {}
+      thread_(&QueuedLogService::run, this) {}
 
-std::unique_ptr<SpdlogLogService> SpdlogLogService::onStandardError(Levels levels,
+std::unique_ptr<QueuedLogService> QueuedLogService::onStandardError(Levels levels,
                                                                     StatisticsService& statistics) {
   std::unique_ptr<LogSink> sink = isJournalStream(STDERR_FILENO)
                                       ? makeJournalLogSink(::sd_journal_sendv)
                                       : makeTextLogSink(STDERR_FILENO);
-  return std::make_unique<SpdlogLogService>(levels, std::move(sink), statistics);
+  return std::make_unique<QueuedLogService>(levels, std::move(sink), statistics);
 }
 
-SpdlogLogService::~SpdlogLogService() { stop(); }
+QueuedLogService::~QueuedLogService() { stop(); }
 
-LogCategory& SpdlogLogService::createCategory(std::string_view subsystem,
+LogCategory& QueuedLogService::createCategory(std::string_view subsystem,
                                               std::string_view category) {
   std::pair<std::string, std::string> names(subsystem, category);
   const MutexLock lock(mutex_);
@@ -72,24 +73,24 @@ LogCategory& SpdlogLogService::createCategory(std::string_view subsystem,
   return *slot;
 }
 
-void SpdlogLogService::stop() {
+void QueuedLogService::stop() {
   queue_.end();
   sink_->finish();
   if (thread_.joinable()) thread_.join();
 }
 
-LogMemory::Contents SpdlogLogService::keptLines() const {
+LogMemory::Contents QueuedLogService::keptLines() const {
   return memory_ == nullptr ? LogMemory::Contents{} : memory_->contents();
 }
 
-void SpdlogLogService::add(LogEntry entry) {
+void QueuedLogService::add(LogEntry entry) {
   received_.add();
   if (queue_.add(std::move(entry))) return;
   dropped_.add();
   unreported_.fetch_add(1, std::memory_order_relaxed);
 }
 
-void SpdlogLogService::run() {
+void QueuedLogService::run() {
   setUpThread("log");
   std::vector<LogEntry> entries;
   while (queue_.take(entries)) {
@@ -101,10 +102,10 @@ void SpdlogLogService::run() {
 }
 
 // Not counted as received: the log says this of itself.
-void SpdlogLogService::reportLosses() {
+void QueuedLogService::reportLosses() {
   const std::uint64_t lost = unreported_.exchange(0, std::memory_order_relaxed);
   if (lost == 0) return;
-  std::string text = detail::logPrefix("SpdlogLogService", __LINE__) + std::to_string(lost) +
+  std::string text = detail::logPrefix("QueuedLogService", __LINE__) + std::to_string(lost) +
                      " lines were dropped: the log is read too slowly";
   const std::size_t length = text.size();
   const LogEntry entry{.time = std::chrono::system_clock::now(),

@@ -1,0 +1,40 @@
+#pragma once
+
+#include <chrono>
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/linux/log/LogQueue.h"
+
+namespace halvox::platform::linux_ {
+
+// The longest text of a line, in bytes after escaping. Clients choose parts of lines: a message of
+// a megabyte must not become a line of a megabyte.
+inline constexpr std::size_t kLongestLogLine = 8192;
+
+// Appends the text of an entry: escaped, to stay one line, and cut at kLongestLogLine with the
+// number of the bytes that are missing.
+void appendLogLineText(std::string& line, const LogEntry& entry);
+
+// Formats entries as lines of text in local time, each with its end:
+//   2024-05-01T12:00:00.123+02:00 error [com.tarno.halvox:hvrs] the line
+// Local time, because readers compare the log with what users report; with the offset, because
+// files of several machines are merged.
+// Belongs to one thread.
+class LogLineFormatter {
+ public:
+  // Valid until the next call.
+  [[nodiscard]] std::string_view format(const LogEntry& entry);
+
+ private:
+  void setSecond(std::chrono::sys_seconds second);
+
+  std::optional<std::chrono::sys_seconds> second_;  // which the two texts below belong to
+  std::string secondText_;
+  std::string zoneText_;
+  std::string line_;
+};
+
+}  // namespace halvox::platform::linux_
