@@ -1,6 +1,6 @@
 # shellcheck shell=bash
-# Helpers for our scripts: what they say, the processes that they start, and leaving nothing behind.
-# To be sourced by a bash script that runs with `set -euo pipefail`.
+# Helpers for our scripts: messages, background processes, and cleaning up. Source it from a bash script
+# that runs with `set -euo pipefail`.
 #
 # A script that starts processes does, before the first:
 #   halvox_make_scratch NAME          # a directory of its own, in $HALVOX_SCRATCH
@@ -26,7 +26,7 @@ fail() {
 }
 
 # Waits until a command succeeds: halvox_wait_for WHAT SECONDS COMMAND...
-# Returns 1, and says what was awaited, when the time is up.
+# Returns 1 and prints WHAT after that time.
 halvox_wait_for() { halvox_wait_for_start "" "$@"; }
 
 # The same for what a process of ours does when it has started: halvox_wait_for_start PID WHAT ...
@@ -81,7 +81,7 @@ halvox_wait() {
   return "$status"
 }
 
-# Stops a process and whatever it started: first politely, after some seconds for good.
+# Stops a process and all processes that it started: with SIGTERM, after some seconds with SIGKILL.
 halvox_stop() {
   local pid=$1 end=$((SECONDS + HALVOX_STOP_SECONDS))
   # The group does not exist before the process has come to make it.
@@ -97,7 +97,7 @@ halvox_stop() {
   halvox_forget "$pid"
 }
 
-# Stops all that is still running, youngest first.
+# Stops all processes that still run, the newest first.
 halvox_stop_all() {
   local entry
   while ((${#HALVOX_PROCESSES[@]} > 0)); do
@@ -110,7 +110,7 @@ halvox_make_scratch() {
   HALVOX_SCRATCH=$(mktemp -d "${TMPDIR:-/tmp}/halvox-$1.XXXXXX")
 }
 
-# The ends of the logs, for a person who has to find out what went wrong.
+# Shows the ends of the logs, to find out what went wrong.
 halvox_show_logs() {
   local log
   for log in "$HALVOX_SCRATCH"/*.log; do
@@ -123,7 +123,7 @@ halvox_show_logs() {
 halvox_clean_up() {
   local status=$?
   trap '' INT TERM HUP
-  # 130 and above: somebody asked for the end, that is no failure.
+  # 130 and above: a signal such as Ctrl-C ended the script, which is not a failure.
   if ((status != 0 && status < 129)) && [ -n "$HALVOX_SCRATCH" ]; then
     halvox_show_logs
   fi

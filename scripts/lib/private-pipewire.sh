@@ -4,7 +4,7 @@
 # streams really run; its monitor is the only source. WirePlumber links streams to it.
 #
 # As a program:  private-pipewire.sh check
-#   Says which tools are missing; exit status 1 then.
+#   Prints the missing tools; exits with 1 if there are any.
 #                private-pipewire.sh serve DIRECTORY
 #   Prints "ready" once streams can run, then "restarted" for each line "restart" that it reads, and
 #   stops everything when its standard input ends. The environment that clients need is in
@@ -17,7 +17,7 @@
 
 HALVOX_AUDIO_TOOLS=(dbus-daemon pipewire wireplumber pw-cli pw-dump pw-play pw-record)
 
-# Says which tools are missing, if any; returns 1 then.
+# Prints the missing tools; returns 1 if there are any.
 halvox_audio_check() {
   local tool missing=()
   for tool in "${HALVOX_AUDIO_TOOLS[@]}"; do
@@ -34,7 +34,7 @@ halvox_audio_write_configuration() {
   mkdir -p "$directory/config/wireplumber/main.lua.d" \
     "$directory/config/wireplumber/bluetooth.lua.d" "$directory/state"
   mkdir -m 700 "$directory/run"
-  # On a machine with sound cards: hands off them.
+  # Do not use the machine's sound cards.
   printf '%s.enabled = false\n' alsa_monitor v4l2_monitor libcamera_monitor \
     >"$directory/config/wireplumber/main.lua.d/60-no-hardware.lua"
   printf 'bluez_monitor.enabled = false\n' \
@@ -83,7 +83,7 @@ context.objects = [
 END
 }
 
-# Puts the caller's environment, and with it all its children, into the private world.
+# Sets the caller's environment so that it and its children use the private server.
 halvox_audio_enter() {
   local directory=$1
   unset PIPEWIRE_REMOTE PIPEWIRE_RUNTIME_DIR PIPEWIRE_CONFIG_DIR PIPEWIRE_CONFIG_NAME
