@@ -55,8 +55,8 @@ class Row:
 class Table:
     def __init__(self, text: str):
         self.rows: dict[str, Row] = {}
-        self.libraries: dict[str, set[str]] = {}
-        self._used: set[int | tuple[int, str]] = set()
+        self.libraries: dict[str, dict[str, int]] = {}
+        self._used: set[tuple[int, str]] = set()
         row = None
         for number, line in enumerate(text.splitlines(), start=1):
             content = line.split("#", 1)[0].rstrip()
@@ -66,7 +66,7 @@ class Table:
             if not colon:
                 raise TableError(f"line {number}: expected 'NAME: FOLDERS', found '{content}'")
             if content.startswith("<"):
-                self.libraries[name.strip("<>")] = set(others.split())
+                self.libraries[name.strip("<>")] = {other: number for other in others.split()}
                 continue
             allowed = {other: number for other in others.split()}
             if not content[0].isspace():
@@ -155,10 +155,12 @@ class Table:
         folder = self.folder_of(path)
         if folder in INNER_RING and path not in self.rows:
             return f"<{name}> is not a header of the standard library"
-        if is_test(path):
-            return None
         for prefix, folders in self.libraries.items():
-            if name.startswith(prefix) and not any(f"{path}/".startswith(f"{one}/") for one in folders):
+            if not name.startswith(prefix):
+                continue
+            users = [one for one in folders if path.startswith(f"{one}/")]
+            self._used.update((folders[one], one) for one in users)
+            if not users and not is_test(path):
                 return f"<{name}> may be included only by {', '.join(sorted(folders))}"
         return None
 
@@ -179,6 +181,10 @@ class Table:
                 for other, number in others.items():
                     if (number, other) not in self._used:
                         yield number, f"no include line uses the arrow from {name} to {other}; remove it"
+        for name, folders in self.libraries.items():
+            for folder, number in folders.items():
+                if (number, folder) not in self._used:
+                    yield number, f"{folder} does not include <{name}>; remove it from the row"
 
 
 def is_test(path: str) -> bool:

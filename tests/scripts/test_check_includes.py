@@ -117,6 +117,12 @@ class TableMistakes(unittest.TestCase):
         self.assertEqual(list(table.unused()),
                          [(3, "no include line uses the arrow from b to c; remove it")])
 
+    def test_unused_library_is_named_with_its_line(self):
+        table = Table("a:\nb:\n<lib/>: a b\n")
+        self.assertEqual(list(table.breaches("b/X.cpp", "#include <lib/x.h>\n")), [])
+
+        self.assertEqual(list(table.unused()), [(3, "a does not include <lib/>; remove it from the row")])
+
     def test_circle_is_found(self):
         self.assertEqual(Table("a: b\nb: c\nc: a\n").circle(), ["a", "b", "c", "a"])
 
