@@ -34,7 +34,7 @@ INTERFACE = "com.tarno.halvox.HVReportingServiceProtocol"
 # Whatever ends a test, also a time-out that kills it, ends what it started.
 WITH_US = ["setpriv", "--pdeathsig", "KILL", "--"]
 # Seconds. A sanitized service reads a million events back in most of a minute on a slow machine.
-DEADLINE = 90.0 if os.environ.get("HALVOX_SANITIZE") else 30.0
+DEADLINE = 240.0 if os.environ.get("HALVOX_SANITIZE") else 30.0
 
 NOBODY = 65534  # another user than whoever runs the tests
 
