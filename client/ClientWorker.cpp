@@ -15,12 +15,13 @@ using platform::linux_::MutexLock;
 
 constexpr std::size_t kMaxWaitingOperations = 8192;
 constexpr std::chrono::seconds kFarewell{1};
-// How often to look for work where the system gave no descriptor to be woken through.
+// How often to look for work if there is no descriptor through which producers can wake the thread.
 constexpr std::chrono::milliseconds kPauseWithoutWakeUp{50};
-// What "wait for ever" comes to, so that no point in time lies beyond what the clock can tell.
+// Stands for "wait for ever": larger durations could overflow the clock's time points.
 constexpr std::chrono::hours kLongestWait{24 * 365};
 
-// Threads inherit the signal mask. The program's signals are for its own threads.
+// Blocks all signals while a thread is made, because threads inherit the signal mask. The program's
+// signals must go to the program's own threads.
 class SignalsBlocked {
  public:
   SignalsBlocked() {
@@ -76,12 +77,12 @@ ClientWorker::~ClientWorker() {
 }
 
 bool ClientWorker::send(OutgoingMessage&& message) {
-  // Relaxed: a program that sends while it destroys its client races with itself anyway.
+  // Relaxed is enough: a program that sends while it destroys its client has a race of its own.
   if (closing_.load(std::memory_order_relaxed) || !ring_.tryPush(std::move(message))) {
     dropped_.fetch_add(1, std::memory_order_relaxed);
     return false;
   }
-  // Only a thread that sleeps for want of work is woken: a system call per message saved.
+  // Wake the thread only if it sleeps for lack of work. That saves a system call for each message.
   if (asleep_.load(std::memory_order_seq_cst) && asleep_.exchange(false)) wake();
   return true;
 }
@@ -100,13 +101,13 @@ void ClientWorker::post(SessionOperation operation) {
 }
 
 bool ClientWorker::flush(std::chrono::milliseconds timeout) {
-  // The handler runs on the thread that would have to do it.
+  // The connection handler runs on the thread that would have to do the work.
   if (std::this_thread::get_id() == thread_.get_id()) return false;
   const TimePoint deadline =
       std::chrono::steady_clock::now() + std::min<std::chrono::milliseconds>(timeout, kLongestWait);
   const MutexLock lock(mutex_);
   const std::uint64_t position = ring_.tail();
-  // Flushes with nothing between them share a ticket, so that they cannot fill the lane.
+  // Flushes with nothing between them share a ticket. Otherwise they could fill the lane.
   const bool shares = !lane_.empty() && lane_.back().position == position &&
                       std::holds_alternative<FlushTicket>(lane_.back().step);
   if (!shares) {
@@ -142,7 +143,7 @@ Counters ClientWorker::counters() const {
   counters.refused = refused_.load(std::memory_order_acquire);
   counters.lost = lost_.load(std::memory_order_acquire);
   counters.reconnects = reconnects_.load(std::memory_order_relaxed);
-  // Read last, so that nothing was settled without having been accepted.
+  // Read last. Otherwise more messages could seem settled than accepted.
   counters.accepted = ring_.tail();
   counters.pending = counters.accepted - counters.acknowledged - counters.refused - counters.lost;
   return counters;
@@ -150,7 +151,7 @@ Counters ClientWorker::counters() const {
 
 void ClientWorker::wake() const {
   const std::uint64_t one = 1;
-  // Can only fail when the thread has been woken already, or there is no descriptor at all.
+  // Fails only if the thread has been woken already, or if there is no descriptor.
   static_cast<void>(!write(wakeUp_.get(), &one, sizeof one));
 }
 
@@ -197,7 +198,7 @@ ClientWorker::TimePoint ClientWorker::nextDeadline() const {
 }
 
 void ClientWorker::sleepUntilSomethingHappens() {
-  // poll() passes over negative descriptors.
+  // poll() ignores negative descriptors.
   std::array<pollfd, 3> polled{{{wakeUp_.get(), POLLIN, 0}, {watch_.fd(), POLLIN, 0}, {-1, 0, 0}}};
   if (bus_) {
     const int events = sd_bus_get_events(bus_.get());
@@ -239,7 +240,8 @@ void ClientWorker::giveUpWaitingIfOverflowed() {
     ring_.pop();
     lost_.fetch_add(1, std::memory_order_release);
   }
-  // A new connection is the shortest way from any sessions to those that are wanted now.
+  // The lost operations may have changed any session. Connecting again makes the sessions as they
+  // are wanted now.
   if (state_ != State::kAbsent) loseConnection();
 }
 

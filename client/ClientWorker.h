@@ -24,40 +24,41 @@
 
 namespace halvox::client {
 
-// The thread behind a HalvoxClient and the two lanes that lead to it.
+// The thread of a HalvoxClient, and the two lanes that lead to it.
 //
 //   send() ──► MessageRing ─────────┐
 //                                   ├─► window of open calls ──► socket
 //   session operations ──► lane ────┘
 //
-// Messages go through the ring. Session operations and flushes are few: they go through a lane
-// under a lock, and each notes how many messages the ring had taken before it, so that the worker
-// carries everything out in the order of the calls.
+// Messages go through the ring. Session operations and flushes are rare. They go through a lane
+// with a lock, and each notes how many messages the ring had accepted before it. The worker can
+// therefore carry out everything in the order of the calls.
 //
 //   absent ──socket connects──► connecting ──handshake──► ready
 //     ▲                            │                        │
 //     └────────pause, watch────────┴────────────────────────┘
 //
-// The worker never blocks on the socket: calls are sent while fewer than kMaxOpenCalls are open,
-// and answers are read all the time, so two sides that are both busy writing cannot wait for each
-// other. While nobody answers nothing is taken from the lanes, so they fill up to their bounds.
+// The worker never blocks on the socket. It sends calls while fewer than kMaxOpenCalls are open,
+// and always reads answers, so that client and service cannot both wait for the other to read. If
+// the service does not answer, the worker takes nothing from the lanes, and they fill up to their
+// bounds.
 //
-// A lane that overflows while the service is away (kMaxWaitingOperations) is given up as a whole,
-// with the messages that wait: they count as lost, and the sessions are made as they are by then.
+// If the lane overflows (kMaxWaitingOperations) while there is no service, the worker discards it
+// with the waiting messages, which count as lost. It then makes the sessions in their latest state.
 class ClientWorker {
  public:
   explicit ClientWorker(Options options);
-  // Delivers what is pending for at most a second, then ends the thread.
+  // Delivers pending messages for at most one second, then ends the thread.
   ~ClientWorker();
   ClientWorker(const ClientWorker&) = delete;
   ClientWorker& operator=(const ClientWorker&) = delete;
 
-  // Any thread; see HalvoxClient.
+  // Any thread may call these; see HalvoxClient.
   bool send(OutgoingMessage&& message);
   void post(SessionOperation operation);
   bool flush(std::chrono::milliseconds timeout);
   void setConnectionHandler(std::function<void(bool)> handler);
-  // Orders with nothing: it is news about the past either way.
+  // Relaxed: the answer may be outdated when the caller gets it anyway.
   [[nodiscard]] bool isConnected() const { return connected_.load(std::memory_order_relaxed); }
   [[nodiscard]] std::string socketPath() const;
   [[nodiscard]] Counters counters() const;
@@ -69,12 +70,13 @@ class ClientWorker {
   enum class State : std::uint8_t { kAbsent, kConnecting, kReady };
   enum class CallOutcome : std::uint8_t { kSent, kNoWireForm, kDisconnected };
 
-  // A session operation, or a flush, and how many messages go before it.
+  // A session operation or a flush, and the number of messages before it.
   struct LaneEntry {
     std::uint64_t position = 0;
     std::variant<SessionOperation, FlushTicket> step;
   };
-  // A call that the service has not answered. One for a flush stays until all before it are gone.
+  // A call that the service has not answered. The call of a flush stays here until all calls before
+  // it are answered.
   struct OpenCall {
     ClientWorker* worker = nullptr;
     std::list<OpenCall>::iterator self{};
@@ -126,13 +128,14 @@ class ClientWorker {
   std::atomic<bool> closing_{false};
   std::atomic<bool> connected_{false};
   std::atomic<std::uint64_t> dropped_{0};
-  // Written by the worker only. Released after, and acquired before, what `tail()` tells.
+  // Written only by the worker. counters() reads them before the ring's tail(), so that their sum
+  // is never larger than the accepted messages.
   std::atomic<std::uint64_t> acknowledged_{0};
   std::atomic<std::uint64_t> refused_{0};
   std::atomic<std::uint64_t> lost_{0};
   std::atomic<std::uint64_t> reconnects_{0};
-  // The position of the first entry of the lane. Written under the lock; a producer's own entries
-  // come before its messages because a message is published after it.
+  // The position of the first entry of the lane. Written under the lock. A thread publishes a
+  // message after its earlier operations, so the worker sees these first.
   std::atomic<std::uint64_t> lanePosition_{UINT64_MAX};
 
   mutable platform::linux_::Mutex mutex_;

@@ -9,15 +9,15 @@ namespace {
 
 using platform::linux_::MutexLock;
 
-// Enough to keep a service busy, few enough to know soon what became of a message.
+// Enough to keep the service busy; few enough that the outcome of a message is known soon.
 constexpr std::size_t kMaxOpenCalls = 256;
-// And so many bytes, unless it is one message alone.
+// The same in bytes. A single larger message is allowed.
 constexpr std::size_t kMaxOpenBytes = std::size_t{4} << 20U;
 
 }  // namespace
 
 void ClientWorker::tryConnect() {
-  // Watching comes first: a service that appears after the attempt is then noticed.
+  // Watch before the attempt: a service that appears after it is then noticed.
   watch_.begin();
   auto connected = connectToService(placesToTry());
   if (auto* made = std::get_if<ConnectedBus>(&connected)) {
@@ -29,7 +29,7 @@ void ClientWorker::tryConnect() {
   }
   pauseBeforeRetry();
   if (!closing_.load(std::memory_order_relaxed)) return;
-  // Nobody is there to take what is pending, so the farewell is over.
+  // Nobody can receive the pending messages, so the destructor need not wait longer.
   const MutexLock lock(mutex_);
   endNow_ = true;
   flushed_.notifyAll();
@@ -98,7 +98,7 @@ void ClientWorker::pauseBeforeRetry() {
 
 void ClientWorker::retryNow() {
   if (state_ != State::kAbsent) return;
-  // A socket appears a moment before it is listened on: the next attempts follow soon.
+  // A socket appears a moment before the service listens on it. Try again soon.
   pause_ = options_.reconnectMin;
   retryAt_ = {};
 }
@@ -138,7 +138,8 @@ bool ClientWorker::sendNext() {
     sendFlush(ticket);
     return true;
   }
-  // The ring is looked at first: what one thread posted before this message is then in the lane.
+  // Look at the ring first: operations that a thread posted before this message are then visible in
+  // the lane.
   const bool hasMessage = ring_.isReady();
   if (lanePosition_.load(std::memory_order_acquire) <= ring_.head()) {
     sendFromLane();
@@ -165,7 +166,7 @@ void ClientWorker::sendFromLane() {
     return;
   }
   const auto& operation = std::get<SessionOperation>(entry.step);
-  // Before it is sent: should the connection end right here, it is made good with the rest.
+  // Note it before sending: if the connection ends here, it is made again with the rest.
   made_.apply(operation);
   sendOperation(operation);
 }
@@ -177,13 +178,14 @@ void ClientWorker::sendOperation(const SessionOperation& operation) {
     if (call(std::move(request), {}) == CallOutcome::kDisconnected) loseConnection();
     return;
   }
-  // The service answers a start at the stop. Nobody waits for that, so no answer is asked for.
+  // The service answers a start at the stop. The client does not wait for that, so it asks for no
+  // answer.
   const auto* message = std::get_if<BusMessage>(&request);
   if (message == nullptr || sd_bus_send(bus_.get(), message->get(), nullptr) < 0) loseConnection();
 }
 
 void ClientWorker::sendFlush(FlushTicket ticket) {
-  // A query that changes nothing: its answer comes after those to all that went before.
+  // Send a query that changes nothing. Its answer comes after all earlier answers.
   if (call(makeRequest(bus_.get(), "reporterIDValid", 0), {.flush = ticket}) ==
       CallOutcome::kSent) {
     return;
@@ -223,14 +225,14 @@ ClientWorker::CallOutcome ClientWorker::call(Request&& request, const OpenCall& 
     return CallOutcome::kSent;
   }
   open_.pop_back();
-  // With the connection well, it is the message that the library did not like: its size, mostly.
+  // The connection works, so the library refused the message, usually for its size.
   return sd_bus_is_open(bus_.get()) > 0 ? CallOutcome::kNoWireForm : CallOutcome::kDisconnected;
 }
 
 int ClientWorker::onReply(sd_bus_message* answer, void* userData, sd_bus_error* /*error*/) {
   auto& call = *static_cast<OpenCall*>(userData);
   ClientWorker& worker = *call.worker;
-  // The library answers what is open when the connection ends; loseConnection() counts that.
+  // When the connection ends, the library itself answers open calls; loseConnection() counts them.
   if (sd_bus_is_open(worker.bus_.get()) <= 0) return 0;
   worker.onAnswer(call, sd_bus_message_is_method_error(answer, nullptr) > 0);
   return 0;

@@ -13,9 +13,9 @@ namespace {
 using Deadline = std::chrono::steady_clock::time_point;
 using BusSlot = platform::linux_::UniqueHandle<sd_bus_slot*, sd_bus_slot_unref>;
 
-// sd_bus_call() without a limit would wait for ever for a service that holds an answer back.
+// Without a limit, sd_bus_call() would wait for ever for a service that does not answer.
 constexpr std::chrono::milliseconds kShortestTimeout{1};
-// Beyond this a point in time may lie beyond what the clock can tell.
+// Larger durations could overflow the clock's time points.
 constexpr std::chrono::milliseconds kLongestTimeout = std::chrono::hours(24 * 365);
 
 std::chrono::milliseconds bounded(std::chrono::milliseconds timeout) {
@@ -34,8 +34,8 @@ struct BusError {
   BusError& operator=(const BusError&) = delete;
 };
 
-// Handles what has come in, then waits for more, until the deadline at most. Negative errno when
-// the connection is gone or the time is up.
+// Handles what has arrived, then waits for more, until the deadline at most. Returns a negative
+// errno if the connection ended or the deadline has passed.
 int processUntil(sd_bus* bus, Deadline deadline) {
   const int processed = sd_bus_process(bus, nullptr);
   if (processed < 0) return processed;
@@ -184,10 +184,10 @@ Result<bool> HalvoxConnection::startReportingSessionForID(ReporterID id) {
   if (result < 0) return failed<bool>(failureFromCall(result, SD_BUS_ERROR_NULL));
   const HeldReply& reply = *(impl_->heldReplies()[id] = std::move(held));
 
-  // Requests are carried out in their order, so this is answered once the start has been.
+  // Requests are carried out in order, so this is answered after the start was carried out.
   auto behind = impl_->ask(makeRequest(impl_->bus(), "reporterIDValid", id));
   if (!behind) return failed<bool>(std::move(*behind.failure));
-  // A start that was refused has its answer among what has come in by now.
+  // The answer to a refused start has arrived by now.
   while (!reply.answer && sd_bus_process(impl_->bus(), nullptr) > 0) {
   }
   if (reply.answer && !*reply.answer) return *reply.answer;

@@ -11,7 +11,7 @@
 
 namespace halvox::client {
 
-// Whom a message is for: all active sessions, one session, or several. One costs no allocation.
+// The sessions that a message is for: all active ones, one, or several. One needs no allocation.
 using Recipients = std::variant<std::monostate, ReporterID, std::vector<ReporterID>>;
 
 // One message on its way to the service.
@@ -21,37 +21,38 @@ struct OutgoingMessage {
   Category category = 0;
   EventType type = 0;
 
-  // What it counts for against the bound in bytes.
+  // Its size for the bound in bytes.
   [[nodiscard]] std::size_t weight() const;
 };
 
-// The hand-off of messages from any number of threads to one, bounded in items and bytes.
+// Passes messages from any number of threads to one, bounded in items and bytes.
 //
-// A ring of slots that are all there from the start. A producer first reserves room with one
-// addition on each bound, which guarantees it a free slot, then takes the next position with a
-// third: no loop, no lock and no allocation, so nothing that another thread does, or fails to do,
-// can hold up an audio thread. (A lock taken with try_lock would need a second lane for the loser,
-// and the order of one thread's messages would have to be put right again afterwards; a list needs
-// an allocation per message.) A producer that is stopped between the two steps delays the consumer,
-// never another producer.
+// A ring of slots, all allocated at construction. A producer reserves room with one atomic addition
+// for each bound, which guarantees it a free slot. A third addition gives it the next position.
+// There is no loop, lock or allocation, so that no other thread can delay an audio thread. A
+// producer that is interrupted between the two steps delays the consumer, but no other producer.
 //
-// Near the bound, a producer whose own message is too large may for a moment make another's
-// reservation fail as well; that one is dropped and counted like any other.
+// Rejected: try_lock() needs a second lane for the thread that does not get the lock, and the order
+// of that thread's messages must be restored afterwards. A list needs an allocation for each
+// message.
+//
+// Near a bound, a producer whose message is too large can make the reservation of another producer
+// fail for a moment. That message is dropped and counted like any other.
 class MessageRing {
  public:
   MessageRing(std::size_t maxItems, std::size_t maxBytes);
 
-  // Any thread. False when a bound is reached; the message is then untouched.
+  // Any thread may call. Returns false, and leaves the message as it is, if a bound is reached.
   bool tryPush(OutgoingMessage&& message);
-  // How many messages were taken so far; the position that the next one gets.
+  // The number of messages accepted so far, which is the position of the next one.
   [[nodiscard]] std::uint64_t tail() const { return tail_.load(std::memory_order_seq_cst); }
 
-  // The following belong to the consumer's thread.
-  // The position of the oldest message that is still here.
+  // Only the consumer's thread may call the following functions.
+  // The position of the oldest message in the ring.
   [[nodiscard]] std::uint64_t head() const { return head_; }
-  // Whether the oldest message is complete. False too while its producer is still writing it.
+  // True if there is a message and its producer has finished writing it.
   [[nodiscard]] bool isReady() const;
-  // The oldest message; only when isReady().
+  // The oldest message. Call only if isReady().
   [[nodiscard]] const OutgoingMessage& front() const { return slot(head_).message; }
   void pop();
 
@@ -68,10 +69,10 @@ class MessageRing {
   const std::size_t maxBytes_;
   const std::uint64_t mask_;
   const std::unique_ptr<Slot[]> slots_;
-  // What is reserved. The consumer's subtraction orders the emptying of a slot before its reuse.
+  // The reserved room. The consumer's subtraction orders the emptying of a slot before its reuse.
   std::atomic<std::size_t> items_{0};
   std::atomic<std::size_t> bytes_{0};
-  // Hands the orders that producers saw in `items_` on to those with later positions.
+  // Passes the ordering that producers saw in `items_` on to producers with later positions.
   std::atomic<std::uint64_t> tail_{0};
   std::uint64_t head_ = 0;
 };

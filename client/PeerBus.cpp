@@ -34,7 +34,7 @@ Failure badRequest(int error) {
   return badRequest("the request has no form on the wire: " + platform::linux_::errnoText(error));
 }
 
-// A non-blocking stream to that socket; the system's error in the second member when there is none.
+// Connects a non-blocking stream to a socket. On failure the second member is the errno.
 std::pair<UniqueFd, int> connectSocket(const std::string& socketPath) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -43,14 +43,14 @@ std::pair<UniqueFd, int> connectSocket(const std::string& socketPath) {
 
   UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
   if (!fd) return {UniqueFd(), errno};
-  // A full backlog fails with EAGAIN here, so a stalled service cannot hold up the caller either.
+  // With a full backlog this fails with EAGAIN, so a stalled service does not block the caller.
   if (connect(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) < 0) {
     return {UniqueFd(), errno};
   }
   return {std::move(fd), 0};
 }
 
-// 0, or the error of the system.
+// Returns 0 or an errno.
 int startBus(UniqueFd fd, Bus& bus) {
   int result = sd_bus_new(bus.out());
   if (result < 0) return -result;
@@ -84,7 +84,7 @@ Request makeSetServiceType(sd_bus* bus, ReporterID id, ServiceType type) {
   return finish(std::move(*message), result);
 }
 
-// Zero or one array of IDs: none at all stands for all active sessions.
+// Appends zero or one array of IDs. No array stands for all active sessions.
 int appendRecipients(sd_bus_message* message, const Recipients& recipients) {
   std::span<const ReporterID> ids;
   if (const auto* one = std::get_if<ReporterID>(&recipients)) ids = std::span(one, 1);
@@ -156,7 +156,7 @@ Request makeSendMessage(sd_bus* bus, const OutgoingMessage& outgoing) {
 }
 
 Failure failureFromAnswer(sd_bus* bus, sd_bus_message* answer) {
-  // When the connection ends, the library itself answers what is open, with an error.
+  // When the connection ends, the library itself answers open calls with an error.
   if (sd_bus_is_open(bus) <= 0) {
     return {Failure::Kind::kNoService, "", "the service ended the connection"};
   }

@@ -24,17 +24,17 @@ using BusMessage = platform::linux_::UniqueHandle<sd_bus_message*, sd_bus_messag
 // No time-out: the transport's own default would end calls that a busy service still answers.
 inline constexpr std::uint64_t kNoTimeout = UINT64_MAX;
 
-// A connection, the place where it was made, and the places before that at which nothing was.
+// A connection, its place, and the places that were tried before without finding a service.
 struct ConnectedBus {
   Bus bus;
   std::string place;
   std::vector<TriedPlace> passedOver;
 };
 
-// Connects to the first of the places, at least one, at which a service listens, without waiting
-// for it; the handshake goes on in sd_bus_process(). A place with a service that cannot be reached,
-// for whatever reason, ends the search. The failure names the places that were tried. The bus
-// belongs to the calling thread.
+// Connects to the first of the places at which a service listens. `places` must not be empty. Does
+// not wait for the service: the handshake continues in sd_bus_process(). A service that exists but
+// cannot be reached ends the search. The failure names the places that were tried. The bus belongs
+// to the calling thread.
 std::variant<ConnectedBus, Failure> connectToService(const std::vector<std::string>& places);
 
 // A request that is ready to be sent, or why it cannot be put on the wire.
@@ -45,7 +45,7 @@ Request makeRequest(sd_bus* bus, const char* member, ReporterID id);
 Request makeRequest(sd_bus* bus, const SessionOperation& operation);
 Request makeSendMessage(sd_bus* bus, const OutgoingMessage& outgoing);
 
-// The failure that an answer or a negative result of sd_bus_call() stands for.
+// Return the failure that an answer or a negative result of sd_bus_call() means.
 Failure failureFromAnswer(sd_bus* bus, sd_bus_message* answer);
 Failure failureFromCall(int result, const sd_bus_error& error);
 

@@ -4,28 +4,28 @@
 #include <string_view>
 #include <vector>
 
-// Where programs look for the service and for its store, by one rule: the place that was named, and
-// no other; else the user's when something is there, else the system's.
+// Where programs look for the service and its store. One rule for all: only the place that was
+// named, if any; otherwise the user's place if something is there; otherwise the system's.
 namespace halvox::client {
 
-// Where the service's sockets are looked for, in this order. `named`, when it is not empty, is the
-// only one; else $HALVOX_SOCKET is; else there are the user's, in $XDG_RUNTIME_DIR, which counts
-// when it is an absolute path, and the system's. Never empty.
+// Returns the paths of the service's socket to try, in order; never an empty list. If `named` is
+// not empty, it is the only one; otherwise $HALVOX_SOCKET is, if it is set; otherwise the user's,
+// if $XDG_RUNTIME_DIR is an absolute path, then the system's.
 std::vector<std::string> socketPlaces(std::string_view named = {});
 
-// A place that was tried without success, and the system's error there.
+// A place that was tried without success, with the errno of the attempt.
 struct TriedPlace {
   std::string path;
   int error = 0;
 };
 
-// Whether this error says that nothing is at a place, so that the next one is tried: there is no
-// such file, or it is a socket that nobody serves. Any other error is about something that is
-// there.
+// Returns true if the errno means that nothing is at a place and the next one is to be tried: there
+// is no such file, or nobody serves the socket. Any other error concerns something that exists.
 bool meansAbsence(int error);
 
-// "no service found; tried A (No such file or directory), then B (Connection refused)", or for a
-// single place "no service at A: …". `what` is what was looked for; `tried` is not empty.
+// Returns "no service found; tried A (No such file or directory), then B (Connection refused)", or
+// for a single place "no service at A: …". `what` names what was looked for; `tried` must not be
+// empty.
 std::string describeTried(std::string_view what, const std::vector<TriedPlace>& tried);
 
 }  // namespace halvox::client

@@ -10,7 +10,7 @@
 
 namespace halvox::client {
 
-// One step of a session's life, as the service is asked for it.
+// One step of a session's life: one request to the service.
 struct CreateSession {};
 struct DestroySession {};
 struct StartSession {};
@@ -22,15 +22,16 @@ struct SessionOperation {
   SessionStep step;
 };
 
-// What a service that carried out a row of operations has: its sessions with their type,
-// configuration and whether they run. A new service is brought to the same by remake().
-// Plain data, belongs to whoever holds it. Grows with the program's own sessions only.
+// The state of a service after a sequence of operations: its sessions with their type and
+// configuration, and whether they run. remake() gives the operations that bring a new service to
+// the same state. Plain data; the owner provides locking. Grows only with the program's own
+// sessions.
 class SessionTable {
  public:
-  // Follows the service's rules: creating again replaces, configurations are merged, operations on
-  // a session that is not there do nothing.
+  // Applies the service's rules: creating a session again replaces it, configurations are merged,
+  // and operations on an unknown session do nothing.
   void apply(const SessionOperation& operation);
-  // The operations that make all these sessions, in the order in which they were first created.
+  // Returns the operations that make all these sessions, in the order of their creation.
   [[nodiscard]] std::vector<SessionOperation> remake() const;
   [[nodiscard]] std::size_t size() const { return sessions_.size(); }
 

@@ -7,27 +7,27 @@
 
 namespace halvox::client {
 
-// Tells when something appears under the name of one of some sockets, so that a service that comes
-// back is met at once and not at the next attempt. Watches only between begin() and end(): a
-// connected client is not woken by what happens in the directories. Belongs to one thread.
-// Without a directory, or without inotify, it just never tells anything of it.
+// Reports when a file appears under the name of one of several sockets, so that the client connects
+// to a new service at once, not only at the next attempt. Watches only between begin() and end(),
+// so that changes in the directories do not wake a connected client. Belongs to one thread. Reports
+// nothing for a directory that does not exist, or without inotify; the client's attempts go on.
 class SocketWatch {
  public:
   explicit SocketWatch(const std::vector<std::string>& socketPaths);
 
-  // Starts to watch, and tries again to where a directory was not there before.
+  // Starts to watch. Tries again for directories that did not exist before.
   void begin();
   void end();
-  // What to poll for reading; -1 when there is nothing to watch.
+  // The descriptor to poll for reading; -1 if there is nothing to watch.
   [[nodiscard]] int fd() const { return fd_.get(); }
-  // Takes what has happened. True when one of the names has appeared.
+  // Reads the pending events. Returns true if one of the names has appeared.
   bool takeAppeared();
 
  private:
   struct Watched {
     std::string directory;
     std::string name;
-    int watch = -1;  // of inotify; negative: none, the directory is not there
+    int watch = -1;  // of inotify; negative: none, because the directory does not exist
   };
 
   std::vector<Watched> watched_;

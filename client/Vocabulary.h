@@ -9,7 +9,7 @@
 
 #include "client/HalvoxClient.h"
 
-// The numbers that messages and sessions carry, and their names.
+// The numbers of categories, event types and service types, and their names.
 namespace halvox::client {
 
 struct NamedNumber {
@@ -100,14 +100,14 @@ std::span<const NamedNumber> categories();
 std::span<const NamedNumber> eventTypes();
 std::span<const NamedNumber> serviceTypes();
 
-// The name of a number as the service writes it: "Session_Playback", "Start", "telephony".
-// Categories without a name are "Undefined" behind their domain; types without one are "Generic",
-// services "telephony".
+// Return the name of a number in the service's spelling: "Session_Playback", "Start", "telephony".
+// A category without a name is "Undefined", after its domain if it has one. An event type without a
+// name is "Generic", a service type "telephony".
 std::string categoryName(Category category);
 std::string_view eventTypeName(EventType type);
 std::string_view serviceTypeName(ServiceType type);
 
-// The number of a name, in any case of letters; none when there is no such name.
+// Return the number of a name in upper or lower case; nothing for an unknown name.
 std::optional<Category> findCategory(std::string_view name);
 std::optional<EventType> findEventType(std::string_view name);
 std::optional<ServiceType> findServiceType(std::string_view name);

@@ -12,10 +12,10 @@
 namespace halvox::client {
 namespace {
 
-// Arrays, structs and variants inside each other that the wire allows.
+// The deepest nesting of arrays, structs and variants that the wire allows.
 constexpr int kMaxNesting = 64;
 
-// Appends values and remembers why it could not. `path` is where in the message it is.
+// Appends values and remembers the reason of a failure. `path` is the current place in the message.
 class ValueWriter {
  public:
   explicit ValueWriter(sd_bus_message* message) : message_(message) {}

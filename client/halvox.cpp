@@ -15,8 +15,8 @@
 #include "client/WireValue.h"
 #include "platform/linux/base/Utf8.h"
 
-// The handles are plain structs around the C++ objects. No exception may leave this file: all that
-// the calls below can throw is want of memory or threads.
+// The handles are plain structs around the C++ objects. No exception may leave this file. The calls
+// below throw only if memory or threads are exhausted.
 
 namespace client = halvox::client;
 using halvox::platform::Data;
@@ -55,7 +55,7 @@ halvox_result done(Work&& work) noexcept {
   });
 }
 
-// None for texts that may not go into a message.
+// Returns nothing for a text that a message cannot hold.
 std::optional<Value> textValue(const char* text) {
   if (text == nullptr || !halvox::platform::linux_::isUtf8WithoutNul(text)) return std::nullopt;
   return Value(text);
@@ -88,7 +88,7 @@ size_t fill(std::string_view text, char* buffer, size_t size) {
   return text.size();
 }
 
-// A caller that was built with an earlier version has a shorter struct.
+// Copies a caller's struct, which is shorter if the caller was built with an earlier version.
 template <typename Struct>
 Struct takeStruct(const Struct& given) {
   Struct full{};
@@ -128,11 +128,11 @@ const char* halvox_result_text(halvox_result result) {
     case HALVOX_OK:
       return "done";
     case HALVOX_DROPPED:
-      return "dropped: too much is waiting";
+      return "dropped: too many messages are waiting";
     case HALVOX_TIMED_OUT:
-      return "the time was up";
+      return "timed out";
     case HALVOX_BAD_ARGUMENT:
-      return "an argument is missing or no UTF-8 text";
+      return "an argument is missing or is not UTF-8 text";
     case HALVOX_NO_MEMORY:
       return "out of memory or threads";
   }
@@ -145,7 +145,7 @@ size_t halvox_category_name(uint32_t category, char* buffer, size_t size) {
   return fill(client::categoryName(category), buffer, size);
 }
 
-// The tables hold literals, so their views end with a NUL.
+// The names are string literals, so their views end with a NUL.
 const char* halvox_event_type_name(uint16_t type) { return client::eventTypeName(type).data(); }
 
 const char* halvox_service_type_name(uint16_t type) { return client::serviceTypeName(type).data(); }
