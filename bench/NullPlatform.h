@@ -14,6 +14,7 @@
 #include "platform/connection.h"
 #include "platform/device_properties.h"
 #include "platform/dispatch.h"
+#include "platform/fake/ServicesOf.h"
 #include "platform/feature_flags.h"
 #include "platform/kdebug.h"
 #include "platform/log.h"
@@ -181,28 +182,7 @@ class MapStatistics final : public platform::StatisticsService {
 // references to log categories and counters.
 struct NullPlatform {
   explicit NullPlatform(platform::LogLevel level) : log(level) {
-    platform::installServices({.analytics = analytics,
-                               .clock = clock,
-                               .connections = connections,
-                               .deviceProperties = deviceProperties,
-                               .diagnosticReporters = diagnosticReporters,
-                               .dispatch = dispatch,
-                               .featureFlags = featureFlags,
-                               .files = files,
-                               .ioReport = ioReport,
-                               .kdebug = kdebug,
-                               .ktrace = ktrace,
-                               .log = log,
-                               .metrics = metrics,
-                               .notify = notify,
-                               .performanceTraces = performanceTraces,
-                               .powerLog = powerLog,
-                               .preferences = preferences,
-                               .process = process,
-                               .propertyLists = propertyLists,
-                               .resultsFiles = resultsFiles,
-                               .statistics = statistics,
-                               .tlmReporting = tlmReporting});
+    platform::installServices(platform::servicesOf(*this, analytics));
   }
 
   NullAnalytics analytics;

@@ -1,32 +1,13 @@
 #include "platform/fake/FakePlatform.h"
 
+#include "platform/fake/ServicesOf.h"
+
 namespace halvox::platform {
 
 FakePlatform::FakePlatform() { installServices(servicesWith(analytics)); }
 
 Services FakePlatform::servicesWith(AnalyticsService& otherAnalytics) {
-  return {.analytics = otherAnalytics,
-          .clock = clock,
-          .connections = connections,
-          .deviceProperties = deviceProperties,
-          .diagnosticReporters = diagnosticReporters,
-          .dispatch = dispatch,
-          .featureFlags = featureFlags,
-          .files = files,
-          .ioReport = ioReport,
-          .kdebug = kdebug,
-          .ktrace = ktrace,
-          .log = log,
-          .metrics = metrics,
-          .notify = notify,
-          .performanceTraces = performanceTraces,
-          .powerLog = powerLog,
-          .preferences = preferences,
-          .process = process,
-          .propertyLists = propertyLists,
-          .resultsFiles = resultsFiles,
-          .statistics = statistics,
-          .tlmReporting = tlmReporting};
+  return servicesOf(*this, otherAnalytics);
 }
 
 FakePlatform::~FakePlatform() {
