@@ -174,7 +174,7 @@ void ClientWorker::sendFromLane() {
 void ClientWorker::sendOperation(const SessionOperation& operation) {
   Request request = makeRequest(bus_.get(), operation);
   if (!std::holds_alternative<StartSession>(operation.step)) {
-    // A configuration without a form on the wire is the only thing that can fail here for good.
+    // Only a configuration that the wire cannot hold fails here. Trying again would not help.
     if (call(std::move(request), {}) == CallOutcome::kDisconnected) loseConnection();
     return;
   }

@@ -30,7 +30,7 @@ struct Failure {
     kNoService,   // nobody serves the socket, or the connection ended before the answer
     kRefused,     // the service answered with an error
     kTimedOut,    // no answer within the time-out; the request may have been carried out
-    kBadRequest,  // the request has no form on the wire: a text that is not UTF-8, or too large
+    kBadRequest,  // the wire cannot hold the request: a text that is not UTF-8, or too large
   };
   Kind kind = Kind::kNoService;
   std::string name;     // the D-Bus error name; empty if the service gave none

@@ -101,7 +101,7 @@ TEST_F(HalvoxClientTest, ManyOpenStartsDoNotCloseTheWindow) {
   EXPECT_EQ(service_.count("startReportingSessionForID"), 1000U);
 }
 
-// Two sides that both block in writes would stand still for ever here.
+// If both sides blocked in writes, this would never end.
 TEST_F(HalvoxClientTest, LargeMessagesInBothDirectionsDoNotDeadlock) {
   HalvoxClient client(options());
   const std::string large(60'000, 'x');
@@ -165,7 +165,7 @@ TEST_F(HalvoxClientTest, SendingNeverWaitsForAStalledService) {
   const auto elapsed = std::chrono::steady_clock::now() - before;
 
   const Counters stalled = client.counters();
-  EXPECT_LT(elapsed, 10s);  // a wait for the service would last for ever
+  EXPECT_LT(elapsed, 10s);  // waiting for the service would never end
   EXPECT_EQ(stalled.accepted, taken);
   EXPECT_EQ(stalled.accepted + stalled.dropped, std::uint64_t{kThreads} * kEach);
   EXPECT_EQ(stalled.pending, stalled.accepted);

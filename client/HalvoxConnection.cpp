@@ -185,8 +185,8 @@ Result<bool> HalvoxConnection::startReportingSessionForID(ReporterID id) {
   const HeldReply& reply = *(impl_->heldReplies()[id] = std::move(held));
 
   // Requests are carried out in order, so this is answered after the start was carried out.
-  auto behind = impl_->ask(makeRequest(impl_->bus(), "reporterIDValid", id));
-  if (!behind) return failed<bool>(std::move(*behind.failure));
+  auto query = impl_->ask(makeRequest(impl_->bus(), "reporterIDValid", id));
+  if (!query) return failed<bool>(std::move(*query.failure));
   // The answer to a refused start has arrived by now.
   while (!reply.answer && sd_bus_process(impl_->bus(), nullptr) > 0) {
   }

@@ -31,7 +31,7 @@ Failure badRequest(std::string message) {
 }
 
 Failure badRequest(int error) {
-  return badRequest("the request has no form on the wire: " + platform::linux_::errnoText(error));
+  return badRequest("the request cannot be sent: " + platform::linux_::errnoText(error));
 }
 
 // Connects a non-blocking stream to a socket. On failure the second member is the errno.

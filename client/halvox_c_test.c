@@ -95,7 +95,7 @@ static void check_counters(const halvox_client* client) {
   CHECK(counters.dropped == 0 && counters.refused == 0 && counters.lost == 0);
   CHECK(counters.pending == 0 && counters.reconnects == 0);
 
-  /* A caller from before `dropped` was there keeps what is behind its struct. */
+  /* A caller that was built before `dropped` existed keeps the memory after its struct. */
   halvox_counters shorter = {.size = offsetof(halvox_counters, dropped), .dropped = 77};
   CHECK(halvox_client_counters(client, &shorter) == HALVOX_OK);
   CHECK(shorter.accepted == 3 && shorter.dropped == 77);
