@@ -14,7 +14,7 @@ COMMON_SERVICE = "halvox"  # each message is recorded under this and under its s
 
 
 class Stream:
-    """What one stream told; `add` takes its messages in their order."""
+    """What one stream reported; call `add` with its messages in order."""
 
     def __init__(self, service, application):
         self.service = service

@@ -15,7 +15,7 @@ LONGEST_KEY = LONGEST_VALUE = 30  # characters
 
 
 def field(key, value):
-    """As key=value; of a long key the end is shown, as it tells more than the beginning."""
+    """Formats key=value. Shows the end of a long key, which says more than its beginning."""
     text = str(value)
     return "=".join((key if len(key) <= LONGEST_KEY else "…" + key[1 - LONGEST_KEY:],
                      text if len(text) <= LONGEST_VALUE else text[:LONGEST_VALUE - 1] + "…"))

@@ -17,7 +17,7 @@ from pathlib import Path
 
 # What a test program of a mutant may take: a mutant that never ends counts as noticed. Loops are
 # found by the processor's time, which does not depend on what else the machine does; a program that
-# waits for ever is given much longer, so that a busy machine is not taken for a test that notices.
+# waits for ever gets much longer, so that a busy machine does not look like a failing test.
 SHORTEST_LIMIT = 20.0  # seconds of the processor's time
 LIMIT_FACTOR = 10  # of the time that the program takes unchanged
 WAIT_FACTOR = 10  # how many times the limit a program may take in all
@@ -160,7 +160,7 @@ class Tree:
 
     def compile(self, one, file, directory):
         """Compiles an object again with the mutant of `file` below `directory`; the new object, or
-        None when the mutant is no C++."""
+        None if the mutant does not compile."""
         command = self._compile[one]
         to = directory / one.replace("/", "_")
         words = shlex.split(command["command"])

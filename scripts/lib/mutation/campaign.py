@@ -27,7 +27,7 @@ class Outcome:
 
 
 def sources_in(root, folders):
-    """The sources of folders that are no tests, as paths from the root."""
+    """The sources of folders without their tests, as paths from the root."""
     found = []
     for folder in folders:
         for path in sorted((root / folder).rglob("*")):
