@@ -12,9 +12,10 @@ constexpr std::uint64_t kTellingRecords = 256;
 
 }  // namespace
 
-WriterQueue::WriterQueue(const QueueLimits& limits, Backpressure& backpressure)
+WriterQueue::WriterQueue(const QueueLimits& limits, Backpressure& backpressure, Clock clock)
     : limits_(limits),
       backpressure_(backpressure),
+      clock_(std::move(clock)),
       softRecords_(limits.softRecords),
       gatherRecords_(limits.gatherRecords) {}
 
@@ -47,7 +48,7 @@ bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
     work_.waitUntil(mutex_, notBefore);
   }
   writer_ = Writer::kWorking;
-  workingSince_ = std::chrono::steady_clock::now();
+  workingSince_ = clock_();
   const bool wasRequested = std::exchange(roundRequested_, false);
   if (queued_ == 0) return wasRequested;
   take();
@@ -71,7 +72,7 @@ void WriterQueue::finish(std::uint64_t records, std::uint64_t bytes) {
 
 void WriterQueue::disregardTime() {
   const MutexLock lock(mutex_);
-  workingSince_ = std::chrono::steady_clock::now();
+  workingSince_ = clock_();
 }
 
 bool WriterQueue::hasQueued() {
@@ -103,7 +104,7 @@ bool WriterQueue::noteAdded() {
 
 void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {
   if (records == 0) return;
-  const Time now = std::chrono::steady_clock::now();
+  const Time now = clock_();
   const std::chrono::nanoseconds elapsed = now - std::exchange(workingSince_, now);
   // The estimates rise at once and fall by at most a quarter a batch. Too high a limit breaks the
   // promised half second; too low a limit only slows callers for a moment.

@@ -39,10 +39,13 @@ struct QueueLimits {
 class WriterQueue {
  public:
   using Time = std::chrono::steady_clock::time_point;
+  using Clock = std::function<Time()>;
 
   // Raises `backpressure` at the soft limit and relieves it below a quarter of it, so that it does
-  // not flutter. Does not own it; it must outlive the queue.
-  WriterQueue(const QueueLimits& limits, Backpressure& backpressure);
+  // not flutter. Does not own it; it must outlive the queue. `clock` measures how long writing
+  // takes; the writer calls it, under the lock. What take() waits for is real time.
+  WriterQueue(const QueueLimits& limits, Backpressure& backpressure,
+              Clock clock = std::chrono::steady_clock::now);
 
   // Any thread. Waits for room, then runs `append` under the lock and returns true. Returns false
   // without running it when the queue is closed. `append` must not block or throw.
@@ -93,6 +96,7 @@ class WriterQueue {
 
   const QueueLimits limits_;
   Backpressure& backpressure_;
+  const Clock clock_;
   Mutex mutex_;
   Condition work_;
   Condition room_;

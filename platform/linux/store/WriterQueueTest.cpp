@@ -80,10 +80,11 @@ TEST(WriterQueueTest, HoldsFewerRecordsWhenTheirPayloadsAreLarge) {
 
 TEST(WriterQueueTest, TimeSpentOnAFailureDoesNotLowerTheLimit) {
   Backpressure backpressure;
-  WriterQueue queue(kSmall, backpressure);
+  WriterQueue::Time now = soon();
+  WriterQueue queue(kSmall, backpressure, [&now] { return now; });
   addMany(queue, 1);
   ASSERT_TRUE(queue.take(soon(), [] {}));
-  std::this_thread::sleep_for(kSmall.softTime);  // the failure
+  now += kSmall.softTime;  // the failure
   queue.disregardTime();
   queue.finish(1, 0);
 
@@ -94,10 +95,11 @@ TEST(WriterQueueTest, TimeSpentOnAFailureDoesNotLowerTheLimit) {
 
 TEST(WriterQueueTest, HoldsFewerRecordsWhenWritingIsSlow) {
   Backpressure backpressure;
-  WriterQueue queue(kSmall, backpressure);
+  WriterQueue::Time now = soon();
+  WriterQueue queue(kSmall, backpressure, [&now] { return now; });
   addMany(queue, 4);
   ASSERT_TRUE(queue.take(soon(), [] {}));
-  std::this_thread::sleep_for(kSmall.softTime);  // the slow writing
+  now += kSmall.softTime;  // the slow writing
   queue.finish(4, 0);
 
   // Four records took longer than the soft time, so four waiting records are too many.
