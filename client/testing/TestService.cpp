@@ -20,7 +20,6 @@ namespace {
 using platform::linux_::MutexLock;
 using platform::linux_::UniqueFd;
 
-constexpr std::chrono::seconds kPatience{20};
 constexpr ServiceType kUnknownService = 65535;
 
 [[noreturn]] void giveUp(const char* what) {
@@ -73,7 +72,7 @@ std::size_t TestService::count(std::string_view member) {
 }
 
 bool TestService::waitForCalls(std::string_view member, std::size_t count) {
-  const auto deadline = std::chrono::steady_clock::now() + kPatience;
+  const auto deadline = std::chrono::steady_clock::now() + platform::linux_::kTestDeadline;
   const MutexLock lock(mutex_);
   while (static_cast<std::size_t>(std::ranges::count(calls_, member, &RecordedCall::member)) <
          count) {
@@ -257,19 +256,6 @@ TestService::Session* TestService::find(ReporterID id) {
     if (found != connection.sessions.end()) return &found->second;
   }
   return nullptr;
-}
-
-std::string ScratchDirectory::path(std::string_view name) const {
-  return (directory_.path() / name).string();
-}
-
-bool eventually(const std::function<bool()>& holds) {
-  const auto deadline = std::chrono::steady_clock::now() + kPatience;
-  while (!holds()) {
-    if (std::chrono::steady_clock::now() > deadline) return false;
-    std::this_thread::sleep_for(std::chrono::milliseconds(1));
-  }
-  return true;
 }
 
 }  // namespace halvox::client

@@ -15,6 +15,7 @@
 #include "client/HalvoxClient.h"
 #include "platform/linux/base/Mutex.h"
 #include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::client {
@@ -99,16 +100,8 @@ class TestService {
   std::jthread thread_;
 };
 
-// A new directory of a test's own, removed with all that is in it.
-class ScratchDirectory {
- public:
-  [[nodiscard]] std::string path(std::string_view name) const;
-
- private:
-  platform::linux_::ScratchDirectory directory_;
-};
-
-// Waits until something holds, looking often, for as long as a slow machine may need.
-[[nodiscard]] bool eventually(const std::function<bool()>& holds);
+// What tests of clients use besides.
+using platform::linux_::eventually;
+using platform::linux_::ScratchDirectory;
 
 }  // namespace halvox::client

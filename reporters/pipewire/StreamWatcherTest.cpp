@@ -9,6 +9,7 @@
 #include <pipewire/pipewire.h>
 
 #include "platform/linux/pipewire/testing/PrivatePipeWire.h"
+#include "platform/linux/testing/Eventually.h"
 #include "reporters/pipewire/MainLoop.h"
 #include "reporters/pipewire/RecordingReportingClient.h"
 
@@ -18,7 +19,6 @@ namespace {
 using pipewire_testing::ChildProcess;
 using pipewire_testing::PrivatePipeWire;
 using std::chrono::steady_clock;
-constexpr std::chrono::seconds kDeadline{30};
 
 // What the reporter sends for real streams of a private PipeWire.
 class StreamWatcherTest : public testing::Test {
@@ -57,14 +57,8 @@ class StreamWatcherTest : public testing::Test {
     return waitUntil([&] { return std::ranges::count(client.operations(), operation) >= count; });
   }
   [[nodiscard]] bool waitUntil(const std::function<bool()>& condition) const {
-    const auto end = steady_clock::now() + kDeadline;
-    while (!condition()) {
-      if (steady_clock::now() > end) {
-        return false;
-      }
-      pw_loop_iterate(loop->handle(), 100);
-    }
-    return true;
+    return platform::linux_::eventually(condition,
+                                        [this] { pw_loop_iterate(loop->handle(), 100); });
   }
   [[nodiscard]] ChildProcess play(double seconds, const std::string& role = "Music") const {
     return ChildProcess(

@@ -44,12 +44,13 @@ class LinuxClient {
   }
   std::optional<ContractAnswer> answer() {
     constexpr std::uint64_t kSliceMicroseconds = 10'000;
-    const auto deadline = std::chrono::steady_clock::now() + linux_::kTestDeadline;
-    while (!pending_.front()->has_value() && std::chrono::steady_clock::now() < deadline) {
+    const auto hasAnswer = [this] { return pending_.front()->has_value(); };
+    const auto awaitAnswer = [this] {
       if (sd_bus_process(client_->get(), nullptr) == 0) {
         sd_bus_wait(client_->get(), kSliceMicroseconds);
       }
-    }
+    };
+    static_cast<void>(linux_::eventually(hasAnswer, awaitAnswer));  // the caller sees the failure
     const std::optional<ContractAnswer> answer = *pending_.front();
     pending_.pop_front();
     return answer;

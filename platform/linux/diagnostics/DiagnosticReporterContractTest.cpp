@@ -5,6 +5,7 @@
 #include <chrono>
 
 #include "platform/linux/diagnostics/SnapshotFixture.h"
+#include "platform/linux/testing/Eventually.h"
 
 namespace halvox::platform::contract {
 namespace {
@@ -16,13 +17,10 @@ class SnapshotHarness : private linux_::SnapshotFixture {
 
   DiagnosticReporterService& service() { return *SnapshotFixture::service; }
   bool letReply(const std::function<bool()>& condition) {
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
-    while (!condition()) {
-      if (std::chrono::steady_clock::now() > deadline) return false;
+    return linux_::eventually([&] {
       platform.dispatch.advance(std::chrono::milliseconds(1));
-      std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
-    return true;
+      return condition();
+    });
   }
   void end() { SnapshotFixture::service->stop(); }
 

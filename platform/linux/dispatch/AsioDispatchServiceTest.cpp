@@ -19,9 +19,9 @@
 #include <unistd.h>
 
 #include "platform/linux/log/QueuedLogService.h"
-#include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
-#include "platform/linux/testing/WaitFor.h"
+#include "platform/linux/testing/Eventually.h"
+#include "platform/linux/testing/MemoryLogSink.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -103,7 +103,7 @@ TEST_F(AsioDispatchServiceTest, JobThatThrowsIsLoggedAndCountedAndTheQueueGoesOn
   for (const auto threading : {QueueThreading::kOwnThread, QueueThreading::kShared}) {
     const auto queue = createQueue(threading);
     queue->async(JobWeight::kBrief, [] { throw std::runtime_error("out of luck"); });
-    queue->async(JobWeight::kBrief, [] { throw 7; });  // NOLINT(hicpp-exception-baseclass)
+    queue->async(JobWeight::kBrief, [] { throw 7; });  // of no exception class
     EXPECT_TRUE(drain(*queue));
   }
 
@@ -162,7 +162,7 @@ TEST_F(AsioDispatchServiceTest, ThreadOfADroppedQueueEnds) {
     queue->async(JobWeight::kBrief, [] {});
   }
 
-  EXPECT_TRUE(waitFor([before] { return threadsOfThisProcess() == before; }));
+  EXPECT_TRUE(eventually([before] { return threadsOfThisProcess() == before; }));
 }
 
 TEST_F(AsioDispatchServiceTest, QueueMayBeDroppedByItsOwnJob) {
@@ -267,11 +267,11 @@ class AsioDispatchWaitTest : public AsioDispatchServiceTest {
       });
       queue->async(JobWeight::kBrief, [held = held_] {});
     }
-    ASSERT_TRUE(waitFor([&] { return begun_ == queues; }));
+    ASSERT_TRUE(eventually([&] { return begun_ == queues; }));
   }
   // How often the pool's threads began to run so far.
-  static std::uint64_t wakeUps() {
-    std::uint64_t sum = 0;
+  static long wakeUps() {
+    long sum = 0;
     for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
       std::ifstream status(task.path() / "status");
       std::string line;
@@ -279,7 +279,7 @@ class AsioDispatchWaitTest : public AsioDispatchServiceTest {
       if (!line.starts_with("Name:\tpool-")) continue;
       while (std::getline(status, line)) {
         const std::size_t name = line.find("ctxt_switches:");
-        if (name != std::string::npos) sum += std::stoull(line.substr(line.find(':') + 1));
+        if (name != std::string::npos) sum += std::stol(line.substr(line.find(':') + 1));
       }
     }
     return sum;
@@ -296,12 +296,8 @@ TEST_F(AsioDispatchWaitTest, ThousandWaitingQueuesCostNoThreadAndNoWakeUps) {
   letQueuesWait(*service_, 1000, std::chrono::hours(1));
   EXPECT_EQ(threadsOfThisProcess(), before);
 
-  EXPECT_GT(wakeUps(), 0U);
-  ASSERT_TRUE(waitFor([] {
-    const std::uint64_t start = wakeUps();
-    std::this_thread::sleep_for(std::chrono::milliseconds(200));
-    return wakeUps() == start;
-  }));
+  EXPECT_GT(wakeUps(), 0);
+  EXPECT_TRUE(staysQuiet(wakeUps, std::chrono::milliseconds(200)));
   EXPECT_EQ(ended_, 0);
 }
 
@@ -310,18 +306,11 @@ TEST_F(AsioDispatchWaitTest, AWaitThatEndedWakesNobodyWhenItsTimeOutWouldHaveCom
   const auto begun = std::chrono::steady_clock::now();
   letQueuesWait(*service_, 3, kTimeOut);
   for (int signal = 0; signal < 3; ++signal) semaphore_->signal();
-  ASSERT_TRUE(waitFor([&] { return ended_ == 3; }));
-  std::uint64_t settled = 0;
-  ASSERT_TRUE(waitFor([&] {
-    const std::uint64_t last = std::exchange(settled, wakeUps());
-    std::this_thread::sleep_for(std::chrono::milliseconds(100));
-    return settled == last;
-  }));
-  if (std::chrono::steady_clock::now() > begun + kTimeOut) GTEST_SKIP() << "too busy to measure";
+  ASSERT_TRUE(eventually([&] { return ended_ == 3; }));
 
-  std::this_thread::sleep_until(begun + 2 * kTimeOut);  // the quantity measured
-
-  EXPECT_EQ(wakeUps(), settled);
+  if (std::chrono::steady_clock::now() > begun + kTimeOut / 2)
+    GTEST_SKIP() << "too busy to measure";
+  EXPECT_TRUE(staysQuiet(wakeUps, 2 * kTimeOut));
 }
 
 TEST_F(AsioDispatchWaitTest, StopDropsWaitsWithTheJobsBehindThemAndCountsThem) {
@@ -338,7 +327,7 @@ TEST_F(AsioDispatchWaitTest, StopDropsWaitsWithTheJobsBehindThemAndCountsThem) {
     const auto start = std::chrono::steady_clock::now();
     EXPECT_TRUE(service.stop(kTestDeadline));
 
-    EXPECT_LT(std::chrono::steady_clock::now() - start, kTestDeadline / 4);
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(5));
     EXPECT_TRUE(watched.expired());
     EXPECT_EQ(count("jobs discarded at the stop") - before, 200U);
     semaphore_->signal();
@@ -398,7 +387,7 @@ TEST_F(AsioDispatchWaitTest, JobThatWaitsTwiceFailsAndItsFirstWaitGoesOn) {
     queue->waitOn(semaphore_, std::nullopt, [&](WaitOutcome) { ++ended_; });
     queue->waitOn(semaphore_, std::nullopt, [](WaitOutcome) { FAIL(); });
   });
-  ASSERT_TRUE(waitFor([&] { return count("jobs that failed") == 1; }));
+  ASSERT_TRUE(eventually([&] { return count("jobs that failed") == 1; }));
   semaphore_->signal();
   ASSERT_TRUE(drain(*queue));
 

@@ -9,9 +9,9 @@
 
 #include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/log/QueuedLogService.h"
-#include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
-#include "platform/linux/testing/WaitFor.h"
+#include "platform/linux/testing/Eventually.h"
+#include "platform/linux/testing/MemoryLogSink.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -56,7 +56,7 @@ TEST_F(BatchedTurnsTest, JobsRunWhenThePoolIsNotHeldAnyMore) {
   EXPECT_EQ(ran, 0);
   service_.wakePool();
 
-  EXPECT_TRUE(waitFor([&ran] { return ran == 2; }));
+  EXPECT_TRUE(eventually([&ran] { return ran == 2; }));
 }
 
 TEST_F(BatchedTurnsTest, JobsThatHelpedJobsHandOnWakeThePoolToo) {

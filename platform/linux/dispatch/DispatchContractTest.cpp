@@ -6,9 +6,9 @@
 #include "platform/fake/contracts/DispatchWaitContract.h"
 #include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/log/QueuedLogService.h"
-#include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
-#include "platform/linux/testing/WaitFor.h"
+#include "platform/linux/testing/Eventually.h"
+#include "platform/linux/testing/MemoryLogSink.h"
 
 namespace halvox::platform::contract {
 
@@ -17,7 +17,7 @@ namespace adapters {
 class AsioHarness {
  public:
   DispatchService& service() { return service_; }
-  bool letRunUntil(const std::function<bool()>& condition) { return linux_::waitFor(condition); }
+  bool letRunUntil(const std::function<bool()>& condition) { return linux_::eventually(condition); }
 
  private:
   linux_::CounterStatisticsService statistics_;

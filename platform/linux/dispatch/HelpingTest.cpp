@@ -16,9 +16,9 @@
 
 #include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/log/QueuedLogService.h"
-#include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
-#include "platform/linux/testing/WaitFor.h"
+#include "platform/linux/testing/Eventually.h"
+#include "platform/linux/testing/MemoryLogSink.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -42,7 +42,7 @@ class HelpingTest : public ::testing::Test {
     queue.async(JobWeight::kMayBlock, [&thread] { thread = ::gettid(); });
     if (!drain(queue)) return false;
     const std::string status = "/proc/self/task/" + std::to_string(thread) + "/stat";
-    return waitFor([&status] {
+    return eventually([&status] {
       std::string number;
       std::string name;
       char state = 0;
@@ -219,7 +219,7 @@ TEST_F(HelpingTest, EndlessWorkIsLeftToTheOwnThread) {
   queue->async(JobWeight::kBrief, again);
   service_.endHelping();
 
-  EXPECT_TRUE(waitFor([&] { return isDone.load(); }));
+  EXPECT_TRUE(eventually([&] { return isDone.load(); }));
   EXPECT_EQ(helped, 1000);
 }
 

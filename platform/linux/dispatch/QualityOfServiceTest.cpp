@@ -17,10 +17,10 @@
 
 #include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/log/QueuedLogService.h"
-#include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/testing/Eventually.h"
+#include "platform/linux/testing/MemoryLogSink.h"
 #include "platform/linux/testing/NoThreadsToHave.h"
-#include "platform/linux/testing/WaitFor.h"
 
 // What qualities of service and labels of queues do.
 namespace halvox::platform::linux_ {
@@ -102,7 +102,7 @@ TEST_F(QualityOfServiceTest, AQueueKeepsItsPriorityWhoeverAddsItsJobs) {
 }
 
 TEST_F(QualityOfServiceTest, ThreadsForBackgroundWorkAreMadeWhenThereIsSome) {
-  EXPECT_TRUE(waitFor([] { return hasThreadNamed("pool-utility"); }));
+  EXPECT_TRUE(eventually([] { return hasThreadNamed("pool-utility"); }));
   EXPECT_FALSE(hasThreadNamed("pool-background"));
 
   EXPECT_EQ(nicenessInBackground(), stepsBelow(10));
@@ -120,7 +120,7 @@ TEST_F(QualityOfServiceTest, BackgroundJobsThatBlockDelayNeitherQueuesNorTimeOut
       released.wait();
     });
   }
-  ASSERT_TRUE(waitFor([&] { return blocked > 1; }));
+  ASSERT_TRUE(eventually([&] { return blocked > 1; }));
   const auto queue = createQueue(QualityOfService::kUtility, QueueThreading::kShared);
   std::promise<WaitOutcome> outcome;
 
@@ -152,7 +152,7 @@ TEST_F(QualityOfServiceTest, JobsOfSharedQueuesAreCountedByTheirLabel) {
   };
 
   EXPECT_EQ(count("added"), 2U);
-  EXPECT_TRUE(waitFor([&] { return count("run") == 2; }));
+  EXPECT_TRUE(eventually([&] { return count("run") == 2; }));
 }
 
 TEST_F(QualityOfServiceTest, AJobThatFailsIsLoggedWithItsQueue) {

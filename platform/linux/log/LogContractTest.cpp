@@ -5,8 +5,8 @@
 #include <vector>
 
 #include "platform/linux/log/QueuedLogService.h"
-#include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/testing/MemoryLogSink.h"
 
 namespace halvox::platform::contract {
 

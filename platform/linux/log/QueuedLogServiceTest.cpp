@@ -17,8 +17,8 @@
 
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/log/LogLineFormatter.h"
-#include "platform/linux/log/testing/MemoryLogSink.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/testing/MemoryLogSink.h"
 
 namespace halvox::platform::linux_ {
 namespace {

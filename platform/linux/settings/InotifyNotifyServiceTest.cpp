@@ -28,7 +28,7 @@ class InotifyNotifyServiceTest : public SettingsFixture {
     return posts_[token];
   }
   bool waitForPosts(NotifyToken token, int count) {
-    return waitFor([&] { return posts(token) >= count; });
+    return eventually([&] { return posts(token) >= count; });
   }
   // Waits until all earlier changes have been handled.
   void waitUntilSettled() {
@@ -361,7 +361,7 @@ TEST_F(InotifyNotifyServiceTest, SteadyChangesAreNotPutOffForEver) {
   begin();
   int number = 0;
 
-  EXPECT_TRUE(waitFor([&] {
+  EXPECT_TRUE(eventually([&] {
     write(domainFile(kDomain), "a = " + std::to_string(++number));
     return posts(name_) >= 3;
   }));

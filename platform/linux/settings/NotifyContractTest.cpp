@@ -2,14 +2,13 @@
 
 #include "platform/fake/contracts/NotifyContract.h"
 
-#include <chrono>
 #include <filesystem>
 #include <fstream>
-#include <thread>
 
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/settings/InotifyNotifyService.h"
 #include "platform/linux/settings/PreferenceReader.h"
+#include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::contract {
@@ -24,13 +23,10 @@ class InotifyHarness {
   std::shared_ptr<DispatchQueue> queue() { return queue_; }
   void post(const std::string& name) { std::ofstream(directory() / name) << name; }
   bool letRunUntil(const std::function<bool()>& condition) {
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
-    for (;;) {
+    return linux_::eventually([&] {
       platform_.dispatch.runUntilIdle();
-      if (condition()) return true;
-      if (std::chrono::steady_clock::now() > deadline) return false;
-      std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
+      return condition();
+    });
   }
 
  private:

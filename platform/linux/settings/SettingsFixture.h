@@ -1,16 +1,14 @@
 #pragma once
 
-#include <chrono>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <string>
 #include <string_view>
-#include <thread>
 
 #include <gtest/gtest.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
@@ -30,15 +28,6 @@ class SettingsFixture : public testing::Test {
   static std::string read(const std::filesystem::path& file) {
     std::ifstream stream(file, std::ios::binary);
     return {std::istreambuf_iterator<char>(stream), {}};
-  }
-  // Tests the condition every millisecond until it holds. Returns false after 20 seconds.
-  static bool waitFor(const std::function<bool()>& condition) {
-    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
-    while (!condition()) {
-      if (std::chrono::steady_clock::now() > deadline) return false;
-      std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
-    return true;
   }
   // Returns the number of log lines that contain a text.
   [[nodiscard]] std::size_t linesWith(std::string_view text) const {

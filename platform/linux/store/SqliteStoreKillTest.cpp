@@ -44,14 +44,16 @@ class SqliteStoreKillTest : public StoreFixture {
     ::_exit(2);
   }
 
-  // Kills a sending process `time` after its first event. Returns how many of its events were
+  // Kills a sending process when it has sent for `time`. Returns how many of its events were
   // older than half a second at that moment.
   std::size_t killAfter(std::chrono::milliseconds time) {
     progress_->sent = 0;
     const pid_t child = ::fork();
     if (child == 0) sendUntilKilled();
-    EXPECT_TRUE(eventually([&] { return progress_->sent > 0; }));
-    ::usleep(static_cast<useconds_t>(time.count()) * 1000);
+    EXPECT_TRUE(eventually([&] {
+      const std::size_t sent = progress_->sent.load(std::memory_order_acquire);
+      return sent > 0 && progress_->times[sent - 1] - progress_->times[0] >= time;
+    }));
     ::kill(child, SIGKILL);
     const Clock::time_point killed = Clock::now();
     int status = 0;

@@ -201,24 +201,22 @@ TEST_F(SqliteStoreTest, TheDatabaseIsReadableByOwnerAndGroupOnly) {
 }
 
 // Returns how often the writer's thread has gone to sleep so far.
-std::string writerSleeps() {
+long writerSleeps() {
   for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {
     if (readFile(task.path() / "comm") != "halvox-store\n") continue;
     const std::string status = readFile(task.path() / "status");
-    const std::size_t begin = status.find("\nvoluntary_ctxt_switches:");
-    return status.substr(begin, status.find('\n', begin + 1) - begin);
+    constexpr std::string_view kName = "\nvoluntary_ctxt_switches:";
+    return std::stol(status.substr(status.find(kName) + kName.size()));
   }
-  return "there is no such thread";
+  ADD_FAILURE() << "there is no thread of that name";
+  return 0;
 }
 
 TEST_F(SqliteStoreTest, DoesNotWakeUpWhileNothingIsSent) {
   start();
   send(1);
   ASSERT_TRUE(allIsStored());
-  std::string sleeps;
-  ASSERT_TRUE(eventually([&] { return std::exchange(sleeps, writerSleeps()) == sleeps; }));
-  std::this_thread::sleep_for(std::chrono::milliseconds(500));  // the idle time to observe
-  EXPECT_EQ(writerSleeps(), sleeps);
+  EXPECT_TRUE(staysQuiet(writerSleeps, std::chrono::milliseconds(500)));
 }
 
 TEST_F(SqliteStoreTest, RaisesBackpressureUnderAFloodAndRelievesItAfterwards) {

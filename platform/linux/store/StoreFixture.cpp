@@ -4,18 +4,8 @@
 #include <fstream>
 #include <iterator>
 #include <ostream>
-#include <thread>
 
 namespace halvox::platform::linux_ {
-
-bool eventually(const std::function<bool()>& holds) {
-  const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(10);
-  while (!holds()) {
-    if (std::chrono::steady_clock::now() > deadline) return false;
-    std::this_thread::sleep_for(std::chrono::milliseconds(1));
-  }
-  return true;
-}
 
 std::vector<std::string> rows(const std::filesystem::path& database, std::string_view sql) {
   Database connection;

@@ -14,12 +14,10 @@
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/store/SqliteAnalyticsService.h"
 #include "platform/linux/store/SqliteStore.h"
+#include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
-
-// Tests the condition every millisecond until it holds. Returns false after ten seconds.
-[[nodiscard]] bool eventually(const std::function<bool()>& holds);
 
 // Runs a query on a connection of its own. Returns each row as its columns joined by '|'.
 [[nodiscard]] std::vector<std::string> rows(const std::filesystem::path& database,

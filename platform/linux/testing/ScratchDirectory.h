@@ -1,29 +1,22 @@
 #pragma once
 
-#include <cstdlib>
 #include <filesystem>
-#include <stdexcept>
 #include <string>
-#include <system_error>
+#include <string_view>
 
 namespace halvox::platform::linux_ {
 
-// An empty directory of a test's own, removed with all its content in the end. Its path is short
-// enough for sockets in it. Throws when it cannot be made.
+// An empty directory of a test's own. The destructor removes it with its content.
+// Its path is short enough for sockets in it. The constructor throws when it cannot make one.
 class ScratchDirectory {
  public:
-  ScratchDirectory() {
-    std::string name = (std::filesystem::temp_directory_path() / "halvox-test.XXXXXX").string();
-    if (::mkdtemp(name.data()) == nullptr) throw std::runtime_error("no scratch directory");
-    path_ = name;
-  }
+  ScratchDirectory();
   ScratchDirectory(const ScratchDirectory&) = delete;
   ScratchDirectory& operator=(const ScratchDirectory&) = delete;
-  ~ScratchDirectory() {
-    std::error_code ignored;
-    std::filesystem::remove_all(path_, ignored);
-  }
+  ~ScratchDirectory();
   [[nodiscard]] const std::filesystem::path& path() const { return path_; }
+  // The path of an entry in it, as text.
+  [[nodiscard]] std::string path(std::string_view name) const { return (path_ / name).string(); }
 
  private:
   std::filesystem::path path_;

@@ -5,15 +5,6 @@
 
 namespace halvox::platform::linux_ {
 
-bool eventually(const std::function<bool()>& condition) {
-  const auto deadline = std::chrono::steady_clock::now() + kTestDeadline;
-  while (!condition()) {
-    if (std::chrono::steady_clock::now() > deadline) return false;
-    std::this_thread::sleep_for(std::chrono::milliseconds(1));
-  }
-  return true;
-}
-
 ServiceUnderTest::ServiceUnderTest(const std::function<void(ConnectionOptions&)>& configure) {
   ConnectionOptions options;
   options.socket = socketPath();

@@ -11,15 +11,10 @@
 #include "platform/linux/connection/LinuxConnectionService.h"
 #include "platform/linux/connection/testing/TestInterface.h"
 #include "platform/linux/dispatch/Backpressure.h"
+#include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
-
-// How long a test waits for something that must happen.
-inline constexpr std::chrono::seconds kTestDeadline{20};
-
-// True as soon as the condition holds, false when it does not within the deadline.
-bool eventually(const std::function<bool()>& condition);
 
 // The service with the test's object, serving on a thread of its own in a scratch directory.
 class ServiceUnderTest {

@@ -2,9 +2,7 @@
 
 #include <algorithm>
 #include <filesystem>
-#include <functional>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include <gmock/gmock.h>
@@ -14,6 +12,7 @@
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/drivers/testing/MadeReadings.h"
 #include "platform/linux/pipewire/testing/PrivatePipeWire.h"
+#include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
@@ -26,16 +25,6 @@ using ::testing::ElementsAre;
 using Clock = std::chrono::steady_clock;
 
 constexpr auto kDeadline = 30s;
-
-// Asks again and again until it is so; false at the deadline.
-bool waitUntil(const std::function<bool()>& condition) {
-  const auto end = Clock::now() + kDeadline;
-  while (!condition()) {
-    if (Clock::now() > end) return false;
-    std::this_thread::sleep_for(10ms);
-  }
-  return true;
-}
 
 std::vector<std::string> linesOf(const std::shared_ptr<const Reading>& reading,
                                  std::string_view start = "") {
@@ -137,12 +126,12 @@ TEST_F(PipeWireDriverSourceTest, TheFirstReadingHasTheNodesAndTheirStates) {
 
 TEST_F(PipeWireDriverSourceTest, CyclesOfAPlaybackAreCountedWhileAReadingIsHeld) {
   const auto first = source->read();
-  ASSERT_TRUE(waitUntil([&] { return source->isProfiling(); }));
+  ASSERT_TRUE(eventually([&] { return source->isProfiling(); }));
   ChildProcess player = play(2);
 
   ASSERT_EQ(player.wait(), 0);
   // 2 s of cycles of at most 2048 frames.
-  ASSERT_TRUE(waitUntil([&] { return valueOf(source->read(), kCycles) >= 46; }));
+  ASSERT_TRUE(eventually([&] { return valueOf(source->read(), kCycles) >= 46; }));
 
   const auto last = source->read();
   const auto cycles = static_cast<std::uint64_t>(valueOf(last, kCycles));
@@ -160,15 +149,15 @@ TEST_F(PipeWireDriverSourceTest, TheProfilerIsBoundOnlyWhileReadingsAreHeld) {
   EXPECT_FALSE(source->isProfiling());
   auto first = source->read();
   auto second = source->read();
-  ASSERT_TRUE(waitUntil([&] { return source->isProfiling(); }));
+  ASSERT_TRUE(eventually([&] { return source->isProfiling(); }));
 
   first.reset();
   const ChildProcess player = play(20);
-  ASSERT_TRUE(waitUntil([&] { return valueOf(source->read(), kCycles) > 0; }));
+  ASSERT_TRUE(eventually([&] { return valueOf(source->read(), kCycles) > 0; }));
   EXPECT_TRUE(source->isProfiling());
   second.reset();
 
-  EXPECT_TRUE(waitUntil([&] { return !source->isProfiling(); }));
+  EXPECT_TRUE(eventually([&] { return !source->isProfiling(); }));
 }
 
 TEST_F(PipeWireDriverSourceTest, ASourceHasItsChannelsInItsGroupAndLosesThemWhenItGoes) {
@@ -180,10 +169,10 @@ TEST_F(PipeWireDriverSourceTest, ASourceHasItsChannelsInItsGroupAndLosesThemWhen
     creator.writeLine(
         "create-node adapter { factory.name=support.null-audio-sink node.name=demo-microphone "
         "media.class=Audio/Source/Virtual audio.position=[ MONO ] }");
-    ASSERT_TRUE(waitUntil([&] { return valueOf(source->read(), kSource) == 0; }));
+    ASSERT_TRUE(eventually([&] { return valueOf(source->read(), kSource) == 0; }));
   }
 
-  EXPECT_TRUE(waitUntil([&] { return valueOf(source->read(), kSource) == -1; }));
+  EXPECT_TRUE(eventually([&] { return valueOf(source->read(), kSource) == -1; }));
 }
 
 TEST_F(PipeWireDriverSourceTest, AServerThatAppearsWhileAReadingIsHeldIsFound) {
@@ -198,8 +187,8 @@ TEST_F(PipeWireDriverSourceTest, AServerThatAppearsWhileAReadingIsHeldIsFound) {
 
   std::filesystem::rename(elsewhere, socket);
 
-  EXPECT_TRUE(waitUntil([&] { return valueOf(early.read(), kConnections) == 1; }));
-  EXPECT_TRUE(waitUntil([&] { return early.isProfiling(); }));
+  EXPECT_TRUE(eventually([&] { return valueOf(early.read(), kConnections) == 1; }));
+  EXPECT_TRUE(eventually([&] { return early.isProfiling(); }));
 }
 
 TEST_F(PipeWireDriverSourceTest, ARestartedServerIsFoundAgainAndItsNodesCountOn) {
@@ -208,7 +197,7 @@ TEST_F(PipeWireDriverSourceTest, ARestartedServerIsFoundAgainAndItsNodesCountOn)
     ChildProcess player = play(0.5);
     ASSERT_EQ(player.wait(), 0);
   }
-  ASSERT_TRUE(waitUntil([&] { return valueOf(source->read(), kCycles) > 0; }));
+  ASSERT_TRUE(eventually([&] { return valueOf(source->read(), kCycles) > 0; }));
   const auto before = valueOf(source->read(), kCycles);
 
   ASSERT_TRUE(audio->restart());
@@ -217,8 +206,8 @@ TEST_F(PipeWireDriverSourceTest, ARestartedServerIsFoundAgainAndItsNodesCountOn)
     return valueOf(source->read(), "pipewire/Speaker/PipeWire/connections") == 2 &&
            valueOf(source->read(), kCycles) >= before;
   };
-  EXPECT_TRUE(waitUntil(isBack));
-  EXPECT_TRUE(waitUntil([&] { return source->isProfiling(); }));
+  EXPECT_TRUE(eventually(isBack));
+  EXPECT_TRUE(eventually([&] { return source->isProfiling(); }));
 }
 
 }  // namespace

@@ -11,7 +11,6 @@
 #include <memory>
 #include <string>
 #include <string_view>
-#include <thread>
 
 #include <arpa/inet.h>
 #include <fcntl.h>
@@ -27,21 +26,14 @@
 #include "platform/linux/link/nats/NatsHandles.h"
 #include "platform/linux/link/nats/NatsTlmReporting.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::contract {
 namespace {
 
+using linux_::eventually;
 using linux_::UniqueFd;
-
-bool eventually(const std::function<bool()>& holds) {
-  const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(30);
-  while (!holds()) {
-    if (std::chrono::steady_clock::now() > end) return false;
-    std::this_thread::sleep_for(std::chrono::milliseconds(2));
-  }
-  return true;
-}
 
 sockaddr_in loopback(int port) {
   sockaddr_in address{};
@@ -145,7 +137,7 @@ class NatsHarness {
     reader_.reset();
     connection_.reset();
     dispatch_.stop(std::chrono::seconds(5));
-    (void)link_->close();
+    static_cast<void>(link_->close());
   }
   NatsHarness(const NatsHarness&) = delete;
   NatsHarness& operator=(const NatsHarness&) = delete;
@@ -158,7 +150,7 @@ class NatsHarness {
     }
     return arrived_;
   }
-  void breakSending() { (void)link_->close(); }
+  void breakSending() { static_cast<void>(link_->close()); }
 
  private:
   void connect() {

@@ -29,8 +29,8 @@
 #include "platform/fake/contracts/KtraceContract.h"
 #include "platform/fake/contracts/PerformanceTraceContract.h"
 #include "platform/linux/dispatch/AsioDispatchService.h"
+#include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
-#include "platform/linux/testing/WaitFor.h"
 #include "platform/linux/tracing/lttng/LttngControl.h"
 #include "platform/linux/tracing/lttng/LttngKtraceService.h"
 #include "platform/linux/tracing/lttng/LttngPerformanceTraceService.h"
@@ -54,7 +54,7 @@ class TestDaemon {
       ::_exit(127);
     }
     isAnswering_ =
-        linux_::waitFor([this] { return ::lttng_session_daemon_alive() == 1 || !runs(); }) &&
+        linux_::eventually([this] { return ::lttng_session_daemon_alive() == 1 || !runs(); }) &&
         ::lttng_session_daemon_alive() == 1;
   }
   TestDaemon(const TestDaemon&) = delete;
@@ -122,7 +122,7 @@ class LttngHarness {
     ::setenv("PATH", path_.c_str(), 1);
   }
 
-  bool letRunUntil(const std::function<bool()>& condition) { return linux_::waitFor(condition); }
+  bool letRunUntil(const std::function<bool()>& condition) { return linux_::eventually(condition); }
   // The files of a recording exist until it has been read back, packed or given up.
   std::size_t recordings() {
     std::error_code ignored;
