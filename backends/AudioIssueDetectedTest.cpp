@@ -159,7 +159,7 @@ TEST(AudioIssueDetectedTest, AMovedFromMessageHasNoTextsAndNoTimestamp) {
     AudioIssueDetected third;
     third = std::move(second);
     EXPECT_EQ(third, original);
-    // NOLINTNEXTLINE(bugprone-use-after-move)
+    // NOLINTNEXTLINE(bugprone-use-after-move): the test is about the moved-from state
     EXPECT_EQ(second.issueType() + second.node() + second.rtaidClient(), "");
     EXPECT_EQ(second.timestamp(), std::nullopt);
   }

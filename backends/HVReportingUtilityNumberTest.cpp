@@ -40,7 +40,7 @@ TEST(HVReportingUtilityRoundWithPlacesTest, NegativePlacesRoundToTensAndHundreds
 }
 
 TEST(HVReportingUtilityRoundWithPlacesTest, RoundedNumbersStayAsTheyAre) {
-  std::mt19937_64 random(7);  // NOLINT(cert-msc51-cpp): the same values in every run
+  std::mt19937_64 random(7);  // the same values in every run
   std::uniform_real_distribution<double> numbers(-1e6, 1e6);
   for (int round = 0; round < 10'000; ++round) {
     const double once = HVReportingUtilityRoundWithPlaces(numbers(random), 3);
@@ -98,7 +98,7 @@ TEST(HVReportingUtilityBucketTest, NaNTakesTheLastBucket) {
 
 TEST(HVReportingUtilityBucketTest, TheChoiceIsNearestInSortedBuckets) {
   const Array buckets{0, 1, 2, 5, 10, 20, 50, 100};
-  std::mt19937 random(7);  // NOLINT(cert-msc51-cpp): the same values in every run
+  std::mt19937 random(7);  // the same values in every run
   std::uniform_real_distribution<double> numbers(-10, 150);
   for (int round = 0; round < 10'000; ++round) {
     const double number = numbers(random);

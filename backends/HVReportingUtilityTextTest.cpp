@@ -127,7 +127,7 @@ TEST(HVReportingUtilityCategoryStringTest, TheHighHalfCountsFromItsFirstValueToT
 }
 
 TEST(HVReportingUtilityCategoryStringTest, TheTextIsThatOfTheTwoHalves) {
-  std::mt19937 random(20240101);  // NOLINT(cert-msc51-cpp): the same values in every run
+  std::mt19937 random(20240101);  // the same values in every run
   for (int round = 0; round < 100'000; ++round) {
     const auto high = static_cast<std::uint32_t>(random() & 0xFFFE0000U) | 0x00010000U;
     const auto low = static_cast<std::uint32_t>(random() % 20);

@@ -207,9 +207,9 @@ TEST_F(HVReportingUtilityVEKStateManagerTest, ReportsAreCountedAndTheCountsBalan
 TEST_F(HVReportingUtilityVEKStateManagerTest, EachPropertyMayBeReadWhileReportsCome) {
   std::thread reader([this] {
     for (int count = 0; count < 1000; ++count) {
-      (void)manager_.leakedHapticsSessionCounter();
-      (void)manager_.ailmentReporter();
-      (void)manager_.messageCache();
+      static_cast<void>(manager_.leakedHapticsSessionCounter());
+      static_cast<void>(manager_.ailmentReporter());
+      static_cast<void>(manager_.messageCache());
     }
   });
   for (int count = 0; count < 100; ++count) {

@@ -125,7 +125,7 @@ void compare(TLMReportingService& link, const char* url, Run run) {
   jsOptions_Init(&options);
   options.PublishAsync.MaxPending = kPending;
   options.PublishAsync.StallWait = 10'000;
-  (void)measureBackend(link, run.messages / 10);
+  static_cast<void>(measureBackend(link, run.messages / 10));
   if (natsConnection_ConnectTo(connection.out(), url) != NATS_OK ||
       natsConnection_JetStream(context.out(), connection.get(), &options) != NATS_OK) {
     std::abort();
@@ -162,7 +162,7 @@ int main(int argc, char** argv) {
   compare(*link, argv[1],
           {.messages = argc > 2 ? std::strtoul(argv[2], nullptr, 10) : 50'000,
            .rounds = argc > 3 ? std::atoi(argv[3]) : 5});
-  (void)dispatch.stop(std::chrono::seconds(5));
+  static_cast<void>(dispatch.stop(std::chrono::seconds(5)));
   if (!link->close()) std::quick_exit(EXIT_FAILURE);
   return EXIT_SUCCESS;
 }

@@ -100,7 +100,7 @@ bool ProtoReader::skipBytes(std::uint64_t count) {
   return true;
 }
 
-// NOLINTNEXTLINE(misc-no-recursion): the depth is bounded
+// Recursive: the depth is bounded.
 bool ProtoReader::skipValue(std::uint64_t number, ProtoWireType wireType, unsigned depth) {
   switch (wireType) {
     case ProtoWireType::kVarint:
@@ -122,7 +122,7 @@ bool ProtoReader::skipValue(std::uint64_t number, ProtoWireType wireType, unsign
   return fail();  // an end without a start, or one of the two wire types without a meaning
 }
 
-// NOLINTNEXTLINE(misc-no-recursion): the depth is bounded
+// Recursive: the depth is bounded.
 bool ProtoReader::skipGroup(std::uint64_t number, unsigned depth) {
   if (depth > kMaximumGroupDepth) return fail();
   for (;;) {

@@ -179,7 +179,7 @@ void Dictionary::merge(const Dictionary& other) {
     return;
   }
   // This copy keeps the entries alive in case `other` is this dictionary.
-  // NOLINTNEXTLINE(performance-unnecessary-copy-initialization)
+  // NOLINTNEXTLINE(performance-unnecessary-copy-initialization): the copy is the point
   const Dictionary source = other;
   for (const Entry& entry : source) set(entry.key, entry.value);
 }

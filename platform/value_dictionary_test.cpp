@@ -210,7 +210,7 @@ TEST(DictionaryTest, RemovalFromALargeOneBringsItBelowTheIndexAndBack) {
 }
 
 TEST(DictionaryTest, BehavesAsAMapUnderRandomChanges) {
-  std::mt19937 random(3);  // NOLINT(cert-msc51-cpp): the same values in every run
+  std::mt19937 random(3);  // the same values in every run
   Dictionary dictionary;
   std::map<std::string, int> model;
   std::vector<Dictionary> holders;  // hold earlier states, so that changes have to copy

@@ -54,7 +54,7 @@ TEST(KeyTest, LongTextsOwnTheirMemory) {
 
 TEST(KeyTest, CopiesOfALongKeyShareItsText) {
   const Key key(std::string(200, 'x'));
-  const Key copy = key;  // NOLINT(performance-unnecessary-copy-initialization)
+  const Key copy = key;  // NOLINT(performance-unnecessary-copy-initialization): tested
   EXPECT_EQ(copy.text().data(), key.text().data());
 }
 
@@ -62,7 +62,7 @@ TEST(KeyTest, MovedFromKeysCanBeAssignedAndDestroyed) {
   for (const std::size_t length : {3U, 200U}) {
     Key key(std::string(length, 'x'));
     const Key moved = std::move(key);
-    key = moved;  // NOLINT(bugprone-use-after-move)
+    key = moved;  // NOLINT(bugprone-use-after-move): tested
     EXPECT_EQ(key, moved);
     const Key movedAgain = std::move(key);
     EXPECT_EQ(movedAgain.text().size(), length);

@@ -136,7 +136,7 @@ TEST(ValueNumberTest, EqualityIsSymmetricAndTransitive) {
 }
 
 TEST(ValueNumberTest, RandomIntegersEqualTheDoubleThatHoldsThemExactly) {
-  std::mt19937_64 random(11);  // NOLINT(cert-msc51-cpp): the same values in every run
+  std::mt19937_64 random(11);  // the same values in every run
   for (int round = 0; round < 100'000; ++round) {
     const auto number = static_cast<std::int64_t>(random() >> (random() % 64));
     const auto rounded = static_cast<double>(number);

@@ -98,7 +98,7 @@ TEST(ValueStringTest, FourteenBytesNeedNoMemory) {
 
 TEST(ValueStringTest, CopiesShareALongText) {
   const Value text(kSharedText);
-  const Value copy = text;  // NOLINT(performance-unnecessary-copy-initialization)
+  const Value copy = text;  // NOLINT(performance-unnecessary-copy-initialization): tested
   EXPECT_EQ(copy.string().data(), text.string().data());
 }
 
@@ -119,7 +119,7 @@ TEST(ValueStringTest, OtherTextsAreIdenticalToNoConstant) {
 
 TEST(ValueStringTest, CopiesOfAConstantStayIdenticalAndEqual) {
   const Value constant(kLongConstant);
-  const Value copy = constant;  // NOLINT(performance-unnecessary-copy-initialization)
+  const Value copy = constant;  // NOLINT(performance-unnecessary-copy-initialization): tested
   EXPECT_TRUE(copy.isIdenticalTo(kLongConstant));
   EXPECT_EQ(copy, Value(kLongConstant.text()));
 }
@@ -169,7 +169,7 @@ TEST(ArrayTest, ComparesElementByElement) {
 
 TEST(ArrayTest, KeepsItsOrderAndSharesItsValues) {
   const Array array{3, "b", Array{1}};
-  const Array copy = array;  // NOLINT(performance-unnecessary-copy-initialization)
+  const Array copy = array;  // NOLINT(performance-unnecessary-copy-initialization): tested
   EXPECT_EQ(copy.begin(), array.begin());
   ASSERT_EQ(array.size(), 3U);
   EXPECT_EQ(array[0], Value(3));
@@ -181,7 +181,7 @@ TEST(ArrayTest, KeepsItsOrderAndSharesItsValues) {
 
 TEST(ValueCopyTest, CopiesOfEveryKindAreEqual) {
   for (const Value& value : oneOfEachKind()) {
-    const Value copy = value;  // NOLINT(performance-unnecessary-copy-initialization)
+    const Value copy = value;  // NOLINT(performance-unnecessary-copy-initialization): tested
     EXPECT_EQ(copy, value);
     EXPECT_EQ(copy.kind(), value.kind());
   }
@@ -225,7 +225,7 @@ TEST(ValueCopyTest, AValueCanTakeThePlaceOfWhatHoldsIt) {
 TEST(ValueCopyTest, MovedFromValuesAreNoneAndCanBeUsedAgain) {
   for (Value& value : oneOfEachKind()) {
     const Value moved = std::move(value);
-    EXPECT_EQ(value.kind(), ValueKind::kNone);  // NOLINT(bugprone-use-after-move)
+    EXPECT_EQ(value.kind(), ValueKind::kNone);  // NOLINT(bugprone-use-after-move): tested
     value = moved;
     EXPECT_EQ(value, moved);
   }
@@ -234,19 +234,19 @@ TEST(ValueCopyTest, MovedFromValuesAreNoneAndCanBeUsedAgain) {
 TEST(ValueCopyTest, MovedFromContainersAreEmptyAndCanBeUsedAgain) {
   Array array{1, 2};
   const Array movedArray = std::move(array);
-  EXPECT_TRUE(array.empty());  // NOLINT(bugprone-use-after-move)
+  EXPECT_TRUE(array.empty());  // NOLINT(bugprone-use-after-move): tested
   array = movedArray;
   EXPECT_EQ(array.size(), 2U);
 
   Dictionary dictionary{{"a", 1}};
   const Dictionary movedDictionary = std::move(dictionary);
-  EXPECT_TRUE(dictionary.empty());  // NOLINT(bugprone-use-after-move)
+  EXPECT_TRUE(dictionary.empty());  // NOLINT(bugprone-use-after-move): tested
   dictionary.set("b", 2);
   EXPECT_EQ(dictionary, (Dictionary{{"b", 2}}));
 
   Data data = dataOf("x");
   const Data movedData = std::move(data);
-  EXPECT_TRUE(data.bytes().empty());  // NOLINT(bugprone-use-after-move)
+  EXPECT_TRUE(data.bytes().empty());  // NOLINT(bugprone-use-after-move): tested
 }
 
 TEST(ValueCopyTest, ContentsLiveAsLongAsTheirLastHolder) {

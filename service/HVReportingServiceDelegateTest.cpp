@@ -329,7 +329,7 @@ TEST_F(HVReportingServiceDelegateTest, ListingTheActiveSessionsLogsAllSessionsOf
   createAndStart(first, 1);
   forgetSteps();
 
-  (void)delegate_->getAllActiveReportingSessions();
+  static_cast<void>(delegate_->getAllActiveReportingSessions());
 
   EXPECT_THAT(
       lines(LogLevel::kDefault),

@@ -33,7 +33,7 @@ int serve(const Configuration& configuration) {
   LinuxPlatform adapters(configuration);
   platform::installServices(adapters.services());
   if (const auto failure = adapters.open()) {
-    (void)adapters.close();
+    static_cast<void>(adapters.close());
     return refuse(failure->exitStatus, failure->description);
   }
   const auto delegate = std::make_shared<HVReportingServiceDelegate>();

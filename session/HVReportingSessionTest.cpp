@@ -399,8 +399,8 @@ TEST_F(HVReportingSessionTest, PropertiesMayBeReadWhileTheyAreWritten) {
       const std::size_t entries = session->configuration().size();
       EXPECT_TRUE(entries == 0 || entries == 2);
       EXPECT_FALSE(session->description().empty());
-      (void)session->tlmReportingEnabled();
-      (void)session->transactionCompleteBlock();
+      static_cast<void>(session->tlmReportingEnabled());
+      static_cast<void>(session->transactionCompleteBlock());
     }
   });
 

@@ -69,7 +69,7 @@ void writeInterval(Writer& json, int track, const std::string& name, double star
 std::variant<TraceResults, std::string> readTraceResults(const std::string& file) {
   std::ifstream stream(file);
   // A directory opens but cannot be read.
-  if (stream) (void)stream.peek();
+  if (stream) static_cast<void>(stream.peek());
   if (stream.bad() || !stream.is_open()) return platform::linux_::errnoText(errno);
   rapidjson::IStreamWrapper input(stream);
   rapidjson::Document document;

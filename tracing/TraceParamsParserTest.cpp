@@ -310,7 +310,7 @@ TEST_F(TraceParamsParserTest, PointOfAnotherKindIsOneWithoutKeysOfTheTypeBefore)
 }
 
 TEST_F(TraceParamsParserTest, LinesGoToTheTracesCategoryUnderTheParsersName) {
-  (void)TraceParamsParser("/nowhere").loadTraceParams();
+  static_cast<void>(TraceParamsParser("/nowhere").loadTraceParams());
 
   const auto line = platform_.log.lines().at(0);
   EXPECT_EQ(line.category, "hvrt");
@@ -328,7 +328,7 @@ TEST_F(TraceParamsParserTest, RelativeNameStartsFromTheCurrentDirectory) {
 }
 
 TEST_F(TraceParamsParserTest, EmptyNameIsTheCurrentDirectory) {
-  (void)TraceParamsParser("").loadTraceParams();
+  static_cast<void>(TraceParamsParser("").loadTraceParams());
 
   EXPECT_EQ(errors()[0], "Reading from plist file failed with error: no file /current/");
 }

@@ -207,7 +207,7 @@ void measureIdle(const LoadOptions& options, std::vector<Measurement>& results) 
   const Server server(options.programs, ServerKind::kStored);
   const auto client = server.client(1);
   client->pipeline(1000, options.window, options.shape);
-  (void)server.process().settledCpuTime();
+  static_cast<void>(server.process().settledCpuTime());
   const long before = server.process().sleeps();
   std::this_thread::sleep_for(std::chrono::seconds(10));
   results.push_back({"wake-ups in 10 idle seconds",

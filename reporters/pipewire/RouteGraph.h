@@ -18,7 +18,7 @@ struct Route {
   struct Device {
     std::string name;         // the stable node name
     std::string description;  // for people; the name if the node has none
-    // The comparison hides a literal 0. NOLINTNEXTLINE(modernize-use-nullptr)
+    // NOLINTNEXTLINE(modernize-use-nullptr): the comparison hides a literal 0
     friend auto operator<=>(const Device&, const Device&) = default;
   };
   std::vector<Device> devices;

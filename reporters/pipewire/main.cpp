@@ -19,7 +19,7 @@
 
 namespace {
 
-using namespace halvox::pipewire_reporter;  // NOLINT(google-build-using-namespace): the program's
+using namespace halvox::pipewire_reporter;  // the program's own
 
 constexpr int kExitUsage = 2;
 constexpr int kExitSoftware = 70;

@@ -36,7 +36,7 @@ void checkValues(const Frame& frame, const std::vector<Value>& arguments) {
   for (const Value& argument : arguments) {
     require(argument.kind() != ValueKind::kNone);
     memory += argument.memorySize();
-    (void)describe(argument);
+    static_cast<void>(describe(argument));
   }
   require(memory <= kMaxGrowth * frame.body.size());
 

@@ -25,7 +25,7 @@ ExitStatus runFile(const RunScript& script, const CommonOptions& options,
   }
   std::ifstream file(script.file);
   // A directory opens but cannot be read.
-  if (file) (void)file.peek();
+  if (file) static_cast<void>(file.peek());
   if (file.bad() || !file.is_open()) {
     return Complaint("run", options.form(), streams.output, streams.errors)(
         ExitStatus::kBadArguments,

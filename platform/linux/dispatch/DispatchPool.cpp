@@ -15,7 +15,7 @@ DispatchPool::DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService&
 
 DispatchPool::~DispatchPool() {
   stop();
-  (void)waitForEnd(std::chrono::steady_clock::time_point::max());
+  static_cast<void>(waitForEnd(std::chrono::steady_clock::time_point::max()));
 }
 
 // Threads for background work are made by those for utility work, which look after the timer; so

@@ -214,7 +214,7 @@ TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndTheLogTellsItO
   });
   const auto found = find("Tx", std::nullopt);
   gate_.close();
-  (void)sample(found);
+  static_cast<void>(sample(found));
 
   const auto start = Clock::now();
   for (int round = 0; round < 10; ++round) EXPECT_THAT(show(sample(found)), IsEmpty());
@@ -235,7 +235,7 @@ TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
   });
   const auto found = find("Tx", std::nullopt);
   gate_.close();
-  (void)sample(found);
+  static_cast<void>(sample(found));
   gate_.open();
 
   const auto deadline = Clock::now() + 10s;
@@ -322,7 +322,7 @@ TEST_F(LinuxIOReportServiceTest, ReadingsAskedForAreGivenOrLate) {
   });
   const auto found = find("Tx", std::nullopt);
   gate_.close();
-  (void)sample(found);
+  static_cast<void>(sample(found));
   gate_.open();
 
   const auto counted = platform_.statistics.values("driver source made");

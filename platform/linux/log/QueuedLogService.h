@@ -32,7 +32,7 @@ class QueuedLogService final : public LogService {
  public:
   // The least level that is written, and the least that is kept in memory; none: nothing is kept.
   struct Levels {
-    Levels(LogLevel toWrite) : written(toWrite) {}  // NOLINT(google-explicit-constructor)
+    Levels(LogLevel toWrite) : written(toWrite) {}  // implicit: most name one
     Levels(LogLevel toWrite, LogLevel toKeep) : written(toWrite), kept(toKeep) {}
     LogLevel written;
     std::optional<LogLevel> kept;

@@ -44,7 +44,7 @@ int pollTimeout(std::optional<std::chrono::steady_clock::time_point> until) {
 
 void drain(int descriptor) {
   std::uint64_t count = 0;
-  (void)!::read(descriptor, &count, sizeof count);
+  static_cast<void>(!::read(descriptor, &count, sizeof count));
 }
 
 }  // namespace
@@ -72,7 +72,7 @@ NotifyStatus InotifyNotifyService::notify_register_dispatch(std::string_view nam
   token = ++lastToken_;
   waiting_.push_back({std::string(name), token, std::move(queue),
                       std::make_shared<const Handler>(std::move(handler)), std::move(baseline)});
-  (void)::eventfd_write(wake_.get(), 1);
+  static_cast<void>(::eventfd_write(wake_.get(), 1));
   return 0;
 }
 
@@ -94,7 +94,7 @@ void InotifyNotifyService::stop() {
     const MutexLock held(mutex_);
     isStopping_ = true;
     ending.swap(thread_);
-    if (wake_) (void)::eventfd_write(wake_.get(), 1);
+    if (wake_) static_cast<void>(::eventfd_write(wake_.get(), 1));
   }
   if (ending.joinable()) ending.join();
 }

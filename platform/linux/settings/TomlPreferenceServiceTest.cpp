@@ -198,10 +198,10 @@ TEST_F(TomlPreferenceServiceTest, KeysOfManyWordsAreAMistakeNotAnEnd) {
 TEST_F(TomlPreferenceServiceTest, EveryQuestionIsAccountedFor) {
   store("key = 1");
   write(domainFile("broken"), "=");
-  (void)at("key");
-  (void)at("none");
-  (void)at("key", "broken");
-  (void)at("key", "..");
+  static_cast<void>(at("key"));
+  static_cast<void>(at("none"));
+  static_cast<void>(at("key", "broken"));
+  static_cast<void>(at("key", ".."));
 
   EXPECT_THAT(platform_.statistics.values("preferences"),
               UnorderedElementsAre(Pair("asked", 4U), Pair("found", 1U), Pair("absent", 1U),

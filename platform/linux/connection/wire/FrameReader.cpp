@@ -39,7 +39,7 @@ std::uint8_t byteAt(std::span<const std::byte> bytes, std::size_t offset) {
 std::uint32_t numberAt(std::span<const std::byte> bytes, std::size_t offset, bool bigEndian) {
   std::uint32_t number = 0;
   WireReader reader(bytes.subspan(offset, sizeof number), bigEndian);
-  (void)reader.read(number);
+  static_cast<void>(reader.read(number));
   return number;
 }
 

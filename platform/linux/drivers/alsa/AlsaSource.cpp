@@ -31,7 +31,7 @@ std::vector<std::string> namesIn(int directory) {
   UniqueFd own(::fcntl(directory, F_DUPFD_CLOEXEC, 0));
   const Directory stream(::fdopendir(own.get()));
   if (!stream) return names;
-  (void)own.release();  // the stream closes it
+  static_cast<void>(own.release());  // the stream closes it
   while (const dirent* found = ::readdir(stream.get())) {
     if (found->d_name[0] != '.') names.emplace_back(found->d_name);
     if (names.size() == kMostEntries) break;

@@ -126,7 +126,7 @@ TEST_F(AlsaSourceTest, FramesGoOnWhenTheStreamIsPreparedAnew) {
 
   const auto lines = change([this] {
     writeStatus("card0/pcm0p", "RUNNING", 1'474'560 + 1000, 1'490'944 + 1000);
-    (void)source_.read();
+    static_cast<void>(source_.read());
     writeStatus("card0/pcm0p", "RUNNING", 400, 600);
   });
 
@@ -149,7 +149,7 @@ TEST_F(AlsaSourceTest, AnXrunIsATransition) {
   const auto lines = change([this] {
     now_ += 1s;
     writeStatus("card0/pcm0p", "XRUN", 1'474'560, 1'490'944);
-    (void)source_.read();
+    static_cast<void>(source_.read());
     now_ += 1ms;
     writeStatus("card0/pcm0p", "RUNNING", 0, 0);
   });
@@ -172,7 +172,7 @@ TEST_F(AlsaSourceTest, RuntimePowerIsTakenFromTheKernelsOwnCount) {
 
 TEST_F(AlsaSourceTest, WhatVanishesIsLeftOutAndTheRestStays) {
   use("analogue");
-  (void)source_.read();
+  static_cast<void>(source_.read());
 
   std::filesystem::remove(root_.path() / "proc/asound/card0/pcm0p/sub0/status");
   std::filesystem::remove(root_.path() / "sys/class/sound/card0/device/power/runtime_active_time");
@@ -188,7 +188,7 @@ TEST_F(AlsaSourceTest, ACardThatIsPluggedInAgainIsAnother) {
   const auto lines = change([this] {
     const auto card = root_.path() / "proc/asound/card1";
     std::filesystem::rename(card, root_.path() / "gone");
-    (void)source_.read();
+    static_cast<void>(source_.read());
     std::filesystem::rename(root_.path() / "gone", card);
     writeStatus("card1/pcm0p", "RUNNING", 480, 960);
   });

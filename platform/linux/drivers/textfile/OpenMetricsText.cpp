@@ -237,7 +237,8 @@ class Parser {
     line.skipBlanks();
     sample.number = parseNumber(line.takeUntilBlank());
     line.skipBlanks();
-    if (!line.isAtEnd() && !line.startsWith('#')) (void)parseNumber(line.takeUntilBlank());
+    if (!line.isAtEnd() && !line.startsWith('#'))
+      static_cast<void>(parseNumber(line.takeUntilBlank()));
     line.skipBlanks();
     if (line.skip('#')) parseExemplar(line);
     if (!line.isAtEnd()) throw Mistake{"expected the end of the line"};
@@ -247,11 +248,11 @@ class Parser {
   static void parseExemplar(LineCursor& line) {
     line.skipBlanks();
     line.expect('{', "{");
-    (void)parseLabels(line);
+    static_cast<void>(parseLabels(line));
     line.skipBlanks();
-    (void)parseNumber(line.takeUntilBlank());
+    static_cast<void>(parseNumber(line.takeUntilBlank()));
     line.skipBlanks();
-    if (!line.isAtEnd()) (void)parseNumber(line.takeUntilBlank());
+    if (!line.isAtEnd()) static_cast<void>(parseNumber(line.takeUntilBlank()));
     line.skipBlanks();
   }
 

@@ -38,7 +38,7 @@ TEST_F(RemovedFilesTest, AFileThatWasDeletedIsNamedOnceEvenWhenItIsThereAgain) {
 
 TEST_F(RemovedFilesTest, AFileThatIsReplacedOrWrittenToWasNotDeleted) {
   write("a");
-  (void)removed_.take();
+  static_cast<void>(removed_.take());
 
   write("a");
   write("a.new");
@@ -72,7 +72,7 @@ TEST_F(RemovedFilesTest, WithTheDirectoryAllFilesGoAndTheNextOneIsWatched) {
 }
 
 TEST_F(RemovedFilesTest, ManyAreAllNamed) {
-  (void)removed_.take();
+  static_cast<void>(removed_.take());
   for (int file = 0; file < 500; ++file) {
     write(std::to_string(file));
     remove(std::to_string(file));

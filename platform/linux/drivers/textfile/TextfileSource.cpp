@@ -88,7 +88,7 @@ std::vector<std::string> TextfileSource::list(int directory) {
   UniqueFd own(::fcntl(directory, F_DUPFD_CLOEXEC, 0));
   const Directory stream(::fdopendir(own.get()));
   if (!stream) return files;
-  (void)own.release();  // the stream closes it
+  static_cast<void>(own.release());  // the stream closes it
   while (const dirent* found = ::readdir(stream.get())) {
     const std::string_view name = found->d_name;
     if (name.ends_with(".prom") && !name.starts_with('.')) files.emplace_back(name);

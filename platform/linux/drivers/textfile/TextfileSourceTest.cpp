@@ -109,11 +109,11 @@ TEST_F(TextfileSourceTest, AWrongFileIsLeftOutAndNamedOnceWithItsLine) {
 
 TEST_F(TextfileSourceTest, AFileThatIsWrongAgainIsNamedAgain) {
   write("a.prom", "wrong\n");
-  (void)source_.read();
+  static_cast<void>(source_.read());
   writePulses("a.prom", 1);
   EXPECT_THAT(show(), SizeIs(1));
   write("a.prom", "wrong again\n");
-  (void)source_.read();
+  static_cast<void>(source_.read());
 
   EXPECT_THAT(errors(), SizeIs(2));
 }

@@ -4,8 +4,7 @@ namespace halvox::platform::linux_ {
 
 bool isNatsBuilt() { return false; }
 
-// Takes the settings by value as the real one does, which keeps them.
-// NOLINTNEXTLINE(performance-unnecessary-value-param)
+// NOLINTNEXTLINE(performance-unnecessary-value-param): the real one keeps the settings
 std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(Configuration::Link /*link*/,
                                                        const NatsEnvironment& /*environment*/) {
   return nullptr;

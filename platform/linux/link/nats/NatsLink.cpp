@@ -29,7 +29,7 @@ NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environme
   }
 }
 
-NatsLink::~NatsLink() { (void)close(); }
+NatsLink::~NatsLink() { static_cast<void>(close()); }
 
 void NatsLink::discover(TLMReportingService::BackendsCallback found) {
   std::uint64_t waiter = 0;

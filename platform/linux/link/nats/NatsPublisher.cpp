@@ -243,7 +243,7 @@ void NatsPublisher::reclaim() {
   {
     const MutexLock lock(mutex_);
     for (natsMsg*& message : std::span(list.Msgs, static_cast<std::size_t>(list.Count))) {
-      (void)pending_.giveBack(NatsMessage(std::exchange(message, nullptr)));
+      static_cast<void>(pending_.giveBack(NatsMessage(std::exchange(message, nullptr))));
     }
   }
   natsMsgList_Destroy(&list);

@@ -95,7 +95,7 @@ NatsTlmReportingService::NatsTlmReportingService(Configuration::Link options,
       dispatch_(environment.dispatch),
       link_(std::make_shared<NatsLink>(std::move(options), environment)) {}
 
-NatsTlmReportingService::~NatsTlmReportingService() { (void)close(); }
+NatsTlmReportingService::~NatsTlmReportingService() { static_cast<void>(close()); }
 
 bool NatsTlmReportingService::close() { return link_->close(); }
 

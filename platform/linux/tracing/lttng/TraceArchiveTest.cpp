@@ -52,7 +52,7 @@ TEST_F(TraceArchiveTest, WholeArchiveHasItsNameAndNothingElseIsLeft) {
 TEST_F(TraceArchiveTest, ProcessThatIsKilledLeavesNothingBesideTheFinishedArchives) {
   const auto packAndBeKilled = [this] {
     limitFiles();
-    (void)packDirectory(directory_, archive_);
+    static_cast<void>(packDirectory(directory_, archive_));
   };
 
   EXPECT_EXIT(packAndBeKilled(), testing::KilledBySignal(SIGXFSZ), "");

@@ -178,7 +178,7 @@ int drive(const Configuration& configuration) {
       std::cout << answer(driver, command, words) << std::endl;
     }
   }
-  (void)dispatch.stop(std::chrono::seconds(5));
+  static_cast<void>(dispatch.stop(std::chrono::seconds(5)));
   const bool isAllEnded = link->close();
   const TLMReportingOutcome late = link->TLMReportingSendOneMessage({}, {}, {4, 1, {}});
   if (late.sent) std::cout << "log a message was taken after the end\n";

@@ -26,7 +26,7 @@ int refuse(const char* what, natsStatus status) {
 
 void print(natsMsg* message, std::uint64_t sequence) {
   const char* id = "";
-  (void)natsMsgHeader_Get(message, "Nats-Msg-Id", &id);
+  static_cast<void>(natsMsgHeader_Get(message, "Nats-Msg-Id", &id));
   std::printf("{\"subject\":\"%s\",\"sequence\":%llu,\"id\":\"%s\",\"message\":%.*s}\n",
               natsMsg_GetSubject(message), static_cast<unsigned long long>(sequence), id,
               natsMsg_GetDataLength(message), natsMsg_GetData(message));
