@@ -2,16 +2,26 @@
 
 #include <utility>
 
+#include "backends/HVReportingTallyhubBridge.h"
 #include "backends/HVReportingUtility.h"
 #include "platform/services.h"
 #include "platform/statistics.h"
 #include "session/SessionLog.h"
+#include "session/SingleMessage.h"
 #include "session/TracePoints.h"
+#include "session/VolumeMessages.h"
 
 namespace halvox {
 namespace {
 
-// Answers to starts that nobody will get: their session went without having been stopped.
+using platform::Dictionary;
+using platform::Message;
+
+// The category and type of the summary event: all bits set.
+constexpr AudioEventCategory kSummaryCategory{0xFFFFFFFF};
+constexpr AudioEventType kSummaryType = AudioEventType::kUnknown;
+
+// Replies to starts that will never be sent, because the session went without having been stopped.
 platform::Counter& startRepliesDropped() {
   static platform::Counter& counter =
       platform::statistics().counter("start replies", "dropped: session released");
@@ -21,82 +31,23 @@ platform::Counter& startRepliesDropped() {
 }  // namespace
 
 HVReportingSession::HVReportingSession(ReporterID reporterID, ProcessIdentifiers processIdentifiers)
-    : reporterID_(reporterID),
-      mTraceDispatchSemaphore_(platform::dispatch().createSemaphore(0)),
-      processIdentifiers_(std::move(processIdentifiers)) {
-  kSessionLog.info("created reporting session for ID: ", number(reporterID_));
+    : profile_(reporterID, std::move(processIdentifiers), held_),
+      history_(held_),
+      link_(profile_, held_),
+      tracing_(profile_),
+      summary_(profile_, history_) {
+  kSessionLog.info("created reporting session for ID: ", number(reporterID));
   emitTracePoint(ReportingTracePoint::kSessionCreated);
 }
 
 HVReportingSession::~HVReportingSession() {
   emitTracePoint(ReportingTracePoint::kSessionDestroyed);
-  kSessionLog.info("deallocing this session ", number(reporterID_));
-  if (account_ != nullptr) account_->removeBytes(chargedBytes_.load(std::memory_order_relaxed));
+  kSessionLog.info("deallocing this session ", number(reporterID()));
   if (transactionCompleteBlock_.take()) startRepliesDropped().add();
 }
 
-void HVReportingSession::chargeTo(Account account) { account_ = std::move(account); }
-
-void HVReportingSession::charge(std::size_t before, std::size_t after) {
-  if (account_ == nullptr) return;
-  account_->addBytes(after - before);  // wraps, and so takes away, when less is held than before
-  chargedBytes_.fetch_add(after - before, std::memory_order_relaxed);
-}
-
-void HVReportingSession::setProcessIdentifiers(ProcessIdentifiers identifiers) {
-  processIdentifiers_.set(std::move(identifiers));
-}
-
-AudioServiceType HVReportingSession::serviceType() const {
-  return serviceType_.load(std::memory_order_relaxed);
-}
-
-void HVReportingSession::setServiceType(AudioServiceType serviceType) {
-  serviceType_.store(serviceType, std::memory_order_relaxed);
-  kSessionLog.info("setting service type ", serviceName());
-}
-
-// Made from the type each time, so that nobody can see a type with the name of another. The type
-// that a new session has is called "unknown", which is also what its name begins as.
-std::string_view HVReportingSession::serviceName() const {
-  return HVReportingUtilityGenerateServiceNameFromServiceType(serviceType());
-}
-
-bool HVReportingSession::tlmReportingEnabled() const {
-  return tlmReportingEnabled_.load(std::memory_order_relaxed);
-}
-
-void HVReportingSession::setTlmReportingEnabled(bool enabled) {
-  tlmReportingEnabled_.store(enabled, std::memory_order_relaxed);
-}
-
-BoolReply HVReportingSession::transactionCompleteBlock() const {
-  return transactionCompleteBlock_.copy();
-}
-
-void HVReportingSession::setTransactionCompleteBlock(BoolReply block) {
-  transactionCompleteBlock_.set(std::move(block));
-}
-
-BoolReply HVReportingSession::takeTransactionCompleteBlock() {
-  return transactionCompleteBlock_.take();
-}
-
-void HVReportingSession::setConfiguration(const platform::Message& configuration) {
+void HVReportingSession::setConfiguration(const Message& configuration) {
   if (configuration.has_value()) updateConfigurationWithContentsOfConfiguration(*configuration);
-}
-
-void HVReportingSession::updateConfigurationWithContentsOfConfiguration(
-    const platform::Dictionary& configuration) {
-  const auto current = configuration_.lock();
-  const std::size_t before = current->memorySize();
-  current->merge(configuration);
-  charge(before, current->memorySize());
-}
-
-platform::ProcessID HVReportingSession::ownerPid() const {
-  const auto owners = processIdentifiers_.lock();
-  return owners->empty() ? 0 : owners->front();
 }
 
 std::string HVReportingSession::description() const {
@@ -105,45 +56,102 @@ std::string HVReportingSession::description() const {
   return text;
 }
 
+// Appends instead of returning a text: the lines that list all sessions describe many of them.
 void HVReportingSession::appendDescription(std::string& text) const {
   text += "reporterID=";
-  text += std::to_string(number(reporterID_));
+  text += std::to_string(number(reporterID()));
   text += ",serviceName=";
   text += serviceName();
   text += ",ownerPid=";
-  text += std::to_string(ownerPid());
+  text += std::to_string(profile_.ownerPid());
   text += ",HostApplicationDisplayID=";
   text += platform::describe(HVReportingUtilityRetrieveAppName(configuration()));
   text += started() ? ",started=1" : ",started=0";
 }
 
 void HVReportingSession::start() {
-  kSessionLog.debug("starting session owned by ", number(reporterID_));
+  kSessionLog.debug("starting session owned by ", number(reporterID()));
   if (started()) {
-    kSessionLog.info("", number(reporterID_), " is already started");
+    kSessionLog.info("", number(reporterID()), " is already started");
     return;
   }
   started_.store(true, std::memory_order_release);
-  history_.set(MessageHistory());
+  history_.begin();
   emitTracePoint(ReportingTracePoint::kSessionStarted);
-  if (tlmReportingEnabled()) submitLinkStart();
-  startTracing();
+  if (tlmReportingEnabled()) link_.submitStart(shared_from_this());
+  tracing_.start(shared_from_this());
 }
 
+// A started session logs the first line twice. This is required: tools match both.
 void HVReportingSession::stop() {
-  kSessionLog.debug("ending session ", number(reporterID_));
+  kSessionLog.debug("ending session ", number(reporterID()));
   if (!started()) return;
-  kSessionLog.debug("ending session ", number(reporterID_));
+  kSessionLog.debug("ending session ", number(reporterID()));
   emitTracePoint(ReportingTracePoint::kSessionStopped);
   sendVolumeMessages();
-  writeSummaryJson();
+  summary_.writeFile();
   sendSummaryEvent();
-  if (tlmReportingEnabled()) submitLinkStop();
-  stopTracing();
-  // Taken out under the lock but destroyed without it: a long history takes its time.
-  const std::optional<MessageHistory> history = history_.take();
-  charge(history.has_value() ? history->memorySize() : 0, 0);
+  // After the messages above, so that they reach the link before its flush.
+  if (tlmReportingEnabled()) link_.submitStop(shared_from_this());
+  tracing_.stop();
+  // Destroyed at the end of this function, without the lock: a long history takes its time.
+  const std::optional<MessageHistory> history = history_.end();
   started_.store(false, std::memory_order_release);
+}
+
+// Each volume message goes through the session, which records it, and to the analytics service.
+void HVReportingSession::sendVolumeMessages() {
+  summary_.sendVolumeMessages([this](const Message& message) {
+    sendMessage(message, AudioEventCategory::kVolume, AudioEventType::kSummary, true, nullptr);
+    HVReportingTallyhubBridge::handleEvent(message, AudioEventCategory::kVolume,
+                                           AudioEventType::kSummary, shared_from_this());
+  });
+}
+
+void HVReportingSession::sendSummaryEvent() {
+  const Message summary = summary_.createEvent();
+  if (!summary.has_value()) return;
+  kSessionLog.notice("sending summary event for reporter ", number(reporterID()));
+  sendMessage(summary, kSummaryCategory, kSummaryType, true, nullptr);
+}
+
+std::vector<Dictionary> HVReportingSession::createVolumeMessages(const MessageHistory& history,
+                                                                 double minimumPlaytime) {
+  return halvox::createVolumeMessages(history, minimumPlaytime);
+}
+
+void HVReportingSession::sendMessage(const Message& message, AudioEventCategory category,
+                                     AudioEventType type, const ErrorReply& reply,
+                                     const Account& sender) {
+  sendMessage(message, category, type, false, reply, sender);
+}
+
+void HVReportingSession::sendMessage(const Message& message, AudioEventCategory category,
+                                     AudioEventType type, bool /*sync*/, const ErrorReply& reply,
+                                     const Account& sender) {
+  kSessionLog.debug("sending message for session owned by ", number(reporterID()));
+  const Dictionary tagged = HVReportingUtilityAddAudioMessageTag(
+      HVReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(Dictionary())), category, type);
+  const bool isRedundant = history_.record(category, type, tagged);
+  emitTracePoint(ReportingTracePoint::kMessageSent);
+  const bool wasStarted = started();
+  if (tlmReportingEnabled()) {
+    link_.submit(shared_from_this(), {.original = message,
+                                      .tagged = tagged,
+                                      .category = category,
+                                      .type = type,
+                                      .wasStarted = wasStarted,
+                                      .isRedundant = isRedundant,
+                                      .sender = sender != nullptr ? sender : held_.account()});
+  }
+  if (reply) reply(std::nullopt);
+}
+
+void HVReportingSession::sendSingleMessage(const Message& message, AudioEventCategory category,
+                                           AudioEventType type, AudioServiceType serviceType,
+                                           const Dictionary& /*userInfo*/, const ErrorReply& reply,
+                                           const Account& sender) {
+  submitSingleMessage({message, category, type, serviceType}, reply, sender);
 }
 
 }  // namespace halvox

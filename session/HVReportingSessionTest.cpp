@@ -313,9 +313,9 @@ TEST_F(HVReportingSessionTest, AReplyThatGoesWithItsSessionIsCounted) {
 TEST_F(HVReportingSessionTest, TheQueueIsMadeAtItsFirstUseAndKept) {
   const auto session = makeSession();
 
-  const auto queue = session->tlmReportingQueue();
+  const auto queue = session->link().tlmReportingQueue();
 
-  EXPECT_EQ(session->tlmReportingQueue(), queue);
+  EXPECT_EQ(session->link().tlmReportingQueue(), queue);
   ASSERT_EQ(platform_.dispatch.createdQueues().size(), 1U);
   const auto traits = platform_.dispatch.createdQueues()[0];
   EXPECT_EQ(traits.label, "com.tarno.halvox.session.tlmreporting");

@@ -88,8 +88,8 @@ class LinkFixture : public testing::Test {
   }
   // Whether the link is down and forgotten.
   bool holdsNothing() const {
-    return session_->tlmReportingSession() == nullptr &&
-           session_->tlmReportingAgentToken() == nullptr;
+    return session_->link().tlmReportingSession() == nullptr &&
+           session_->link().tlmReportingAgentToken() == nullptr;
   }
 
   platform::FakePlatform platform_;

@@ -2,12 +2,29 @@
 
 #include <string_view>
 
+#include "backends/HVReportingVocabulary.h"
+#include "platform/tlm_reporting.h"
+#include "platform/value.h"
+
 namespace halvox {
 
-// What the service tells the real-time framework of itself, in every session info.
+// How the service identifies itself to the real-time framework, in every session info.
 inline constexpr int kLinkClientType = 19;
 inline constexpr double kHVReportingVersionNumber = 2.1;
-// And in every user info.
+// The same in every user info.
 inline constexpr std::string_view kLinkClientName = "com.tarno.halvox";
+
+// What the framework learns about a session: its state at the moment of its start, whatever changes
+// before the link's start job runs.
+struct LinkStart {
+  AudioServiceType serviceType;
+  std::string_view serviceName;  // a constant of the vocabulary
+  platform::Dictionary configuration;
+
+  [[nodiscard]] platform::Dictionary sessionInfo(
+      ReporterID reporterID, const platform::TLMSecureHierarchyToken& token) const;
+  // Includes the whole configuration, whose entries replace the service's own of the same key.
+  [[nodiscard]] platform::Dictionary userInfo() const;
+};
 
 }  // namespace halvox

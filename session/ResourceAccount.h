@@ -10,10 +10,12 @@
 
 namespace halvox {
 
-// What the service holds for one client at this moment: its sessions with their histories and
-// configurations, its requests that are not carried out yet, and the messages of its requests that
-// wait to go out over the real-time link. Shared by the client object, by its sessions and by the
-// charges below, so it outlives a client whose messages still wait. Any thread may use it.
+// Counts what the service holds for one client: the histories and configurations of its sessions,
+// its requests that have not been carried out, and its messages that wait for the real-time link.
+// The connection layer refuses the client's requests while the account is over its limit.
+//
+// Shared by the client object, its sessions and the charges below. It outlives a client whose
+// messages still wait. Any thread may use it.
 class ResourceAccount {
  public:
   void addBytes(std::size_t bytes) { bytes_.fetch_add(bytes, std::memory_order_relaxed); }
@@ -26,13 +28,14 @@ class ResourceAccount {
   }
 
  private:
-  // They order with nothing: a reader that is a little late only lets one more request in.
+  // Order nothing else: a reader that sees an old value admits one request too many.
   std::atomic<std::uint64_t> bytes_{0};
   std::atomic<std::uint64_t> sessions_{0};
 };
 
-// Bytes that are charged to an account while this lives. A copy charges them once more: jobs are
-// copyable, and a copied job holds its own. Charges nobody when it has no account.
+// Charges a fixed number of bytes to an account for as long as it lives. Without an account it
+// charges nobody. A copy charges the bytes again, because a copied job holds a copy of its message.
+// Belongs to one thread at a time; usually part of a job.
 class ResourceCharge {
  public:
   ResourceCharge() = default;
@@ -55,6 +58,35 @@ class ResourceCharge {
  private:
   std::shared_ptr<ResourceAccount> account_;  // null: nobody is charged
   std::size_t bytes_ = 0;
+};
+
+// Charges to an account what one owner holds, while the amount changes. The destructor gives back
+// whatever is still charged. Without an account it charges nobody.
+// Belongs to one session; its parts report their changes to it from any thread.
+class ResourceTally {
+ public:
+  ResourceTally() = default;
+  ResourceTally(const ResourceTally&) = delete;
+  ResourceTally& operator=(const ResourceTally&) = delete;
+  ~ResourceTally() {
+    if (account_ != nullptr) account_->removeBytes(bytes_.load(std::memory_order_relaxed));
+  }
+
+  // Call at most once, before the first change and before other threads know the owner.
+  void chargeTo(std::shared_ptr<ResourceAccount> account) { account_ = std::move(account); }
+  // The account, or null.
+  [[nodiscard]] const std::shared_ptr<ResourceAccount>& account() const { return account_; }
+  // Something that took `before` bytes takes `after` bytes now.
+  void change(std::size_t before, std::size_t after) {
+    if (account_ == nullptr) return;
+    const std::size_t difference = after - before;  // wraps, and so subtracts, when less is held
+    account_->addBytes(difference);
+    bytes_.fetch_add(difference, std::memory_order_relaxed);
+  }
+
+ private:
+  std::shared_ptr<ResourceAccount> account_;
+  std::atomic<std::size_t> bytes_{0};  // orders nothing else: only the sum matters
 };
 
 }  // namespace halvox

@@ -3,6 +3,7 @@
 #include <utility>
 
 #include "backends/HVReportingUtility.h"
+#include "session/MessageHistory.h"
 
 namespace halvox {
 namespace {
@@ -87,6 +88,22 @@ Dictionary VolumeIntervals::makeMessage(double seconds) const {
           {kVolumeBucketedKey, bucketed(lastVolume_, volumeBuckets(), kVolumeFractionDigits)},
           {kPlaySecondsKey, static_cast<float>(seconds)},
           {kPlaySecondsBucketedKey, bucketed(seconds, secondsBuckets(), kSecondsFractionDigits)}};
+}
+
+platform::Message VolumeWalk::next(const MessageHistory& history) {
+  while (position_ < end_ && position_ < history.size()) {
+    platform::Message message = intervals_.add(history[position_++].message());
+    if (message.has_value()) return message;
+  }
+  return std::nullopt;
+}
+
+std::vector<Dictionary> createVolumeMessages(const MessageHistory& history,
+                                             double minimumPlaytime) {
+  std::vector<Dictionary> messages;
+  VolumeWalk walk(minimumPlaytime, history.size());
+  while (platform::Message message = walk.next(history)) messages.push_back(std::move(*message));
+  return messages;
 }
 
 }  // namespace halvox

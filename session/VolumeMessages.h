@@ -1,32 +1,41 @@
 #pragma once
 
+#include <cstddef>
 #include <optional>
+#include <vector>
 
 #include "platform/value.h"
 
 namespace halvox {
 
-// Finds in a run of messages how long the client played at which volume.
+class MessageHistory;
+
+// Measures how long a client played at which volume, from its messages in order.
 //
-// An interval opens at a message that carries a volume and says that the client plays, goes on over
-// playing messages with the same volume, and ends at the next message with a volume that is another
-// or that says that nothing plays. What is still open at the end is never reported.
+//   closed --playing--> open --playing at the same volume--> open
+//                       open --playing at another volume--> reported, open again
+//                       open --not playing--> reported, closed
 //
-// What clients write is taken as it stands where any value serves (format, devices, process). Where
-// a number is wanted, everything else reads as 0, as it does all over the service: a volume given
-// as text counts as volume 0, which still opens and ends intervals, so no time is counted for a
-// volume that was no longer set; a playing state given as text says that nothing plays. The stamps
-// are the service's own: one that is missing or no number opens no interval and, at the end of one,
-// makes it too short to be reported. Stamps that go backwards make it too short as well.
+// Only messages with a volume count. An interval that is still open after the last message is never
+// reported.
 //
-// Belongs to one thread. Holds the values that it saw last, not the messages.
+// The format, the devices and the process are reported as the client wrote them. Where a number is
+// expected, any other value reads as 0:
+// - A volume that is text counts as volume 0. It still opens and ends intervals, so no time is
+//   counted for a volume that was no longer set.
+// - A playing state that is text means "not playing".
+// - The service stamps the times itself. A message whose stamp is missing or not a number opens no
+//   interval, and an interval that ends there is too short to be reported. The same holds for
+//   stamps that run backwards.
+//
+// Belongs to one thread. Keeps the last values it saw, not the messages.
 class VolumeIntervals {
  public:
-  // Only intervals longer than that many seconds are reported.
+  // Only intervals longer than `minimumPlaytime` seconds are reported.
   explicit VolumeIntervals(double minimumPlaytime) : minimumPlaytime_(minimumPlaytime) {}
 
-  // Takes the next message of the run. Returns the volume message of the interval that it ends, if
-  // it ends one that is long enough.
+  // Takes the next message of the run. Returns the volume message of the interval that this message
+  // ends, if it ends one that is long enough.
   std::optional<platform::Dictionary> add(const platform::Dictionary& message);
 
  private:
@@ -37,7 +46,32 @@ class VolumeIntervals {
   platform::Value devices_{"Unknown"};
   platform::Value process_{"Unknown"};
   platform::Value lastVolume_{-1};
-  std::optional<double> start_;  // none while no interval is open
+  std::optional<double> start_;  // in seconds; none while no interval is open
 };
+
+// Finds the volume messages of a history one at a time, so that the history need not stay locked
+// between them. Only sees the messages that were there at first: sending a volume message adds it
+// to the history that is being walked.
+//
+// Belongs to one thread. Does not hold the history, which the caller passes to each call.
+class VolumeWalk {
+ public:
+  // Walks the first `messages` messages; reports intervals longer than `minimumPlaytime` seconds.
+  VolumeWalk(double minimumPlaytime, std::size_t messages)
+      : intervals_(minimumPlaytime), end_(messages) {}
+
+  // The next volume message, or none at the end. `history` is the same in every call.
+  platform::Message next(const MessageHistory& history);
+
+ private:
+  VolumeIntervals intervals_;
+  std::size_t position_ = 0;
+  const std::size_t end_;
+};
+
+// All volume messages of a history, in the order in which their intervals ended. Intervals of at
+// most `minimumPlaytime` seconds are not reported.
+[[nodiscard]] std::vector<platform::Dictionary> createVolumeMessages(const MessageHistory& history,
+                                                                     double minimumPlaytime);
 
 }  // namespace halvox

@@ -23,9 +23,9 @@ const std::string kDirectory =
     "/private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
 const std::string kName = "20231114-221320+0000-halvox-Unknown-haptics.json";
 
-class HVReportingSessionSummaryFileTest : public SummaryFixture {
+class SessionSummaryFileTest : public SummaryFixture {
  protected:
-  HVReportingSessionSummaryFileTest() { platform_.deviceProperties.set("InternalBuild", true); }
+  SessionSummaryFileTest() { platform_.deviceProperties.set("InternalBuild", true); }
 
   // The name of the only file.
   std::string name() const { return platform_.files.files().at(0).name; }
@@ -38,7 +38,7 @@ class HVReportingSessionSummaryFileTest : public SummaryFixture {
   }
 };
 
-TEST_F(HVReportingSessionSummaryFileTest, HoldsTheHistoryInOrder) {
+TEST_F(SessionSummaryFileTest, HoldsTheHistoryInOrder) {
   send({{"foo", 1}});
   send({{"foo", 2}});
 
@@ -52,7 +52,7 @@ TEST_F(HVReportingSessionSummaryFileTest, HoldsTheHistoryInOrder) {
   EXPECT_THAT(platform_.files.files(), ElementsAre(expected));
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, ItsDirectoryIsMadeForEverybody) {
+TEST_F(SessionSummaryFileTest, ItsDirectoryIsMadeForEverybody) {
   send({{"foo", 1}});
 
   session_->stop();
@@ -60,7 +60,7 @@ TEST_F(HVReportingSessionSummaryFileTest, ItsDirectoryIsMadeForEverybody) {
   EXPECT_THAT(platform_.files.directories(), ElementsAre(Pair(kDirectory, 511U)));
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, IsNamedByLocalTimeApplicationAndService) {
+TEST_F(SessionSummaryFileTest, IsNamedByLocalTimeApplicationAndService) {
   platform_.clock.setOffsetFromUTC(std::chrono::minutes(-90));
   session_->setConfiguration(Dictionary{{"HostApplicationDisplayID", "../../player"}});
   session_->setServiceType(AudioServiceType::kTelephony);
@@ -71,7 +71,7 @@ TEST_F(HVReportingSessionSummaryFileTest, IsNamedByLocalTimeApplicationAndServic
   EXPECT_EQ(name(), "20231114-204320-0130-halvox-___.._player-telephony.json");
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, AnApplicationThatIsNoTextHasANameToo) {
+TEST_F(SessionSummaryFileTest, AnApplicationThatIsNoTextHasANameToo) {
   session_->setConfiguration(Dictionary{{"HostApplicationDisplayID", 42}});
   send({{"foo", 1}});
 
@@ -80,7 +80,7 @@ TEST_F(HVReportingSessionSummaryFileTest, AnApplicationThatIsNoTextHasANameToo) 
   EXPECT_EQ(name(), "20231114-221320+0000-halvox-42-haptics.json");
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, HoldsTheVolumeMessagesAndNotTheSummaryEvent) {
+TEST_F(SessionSummaryFileTest, HoldsTheVolumeMessagesAndNotTheSummaryEvent) {
   playTwoVolumes();
 
   session_->stop();
@@ -89,7 +89,7 @@ TEST_F(HVReportingSessionSummaryFileTest, HoldsTheVolumeMessagesAndNotTheSummary
                                   "Volume_Summary_1", "Volume_Summary_2"));
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, IsWrittenThoughNothingWasPlayed) {
+TEST_F(SessionSummaryFileTest, IsWrittenThoughNothingWasPlayed) {
   silent(10);
   platform_.log.clear();
 
@@ -100,7 +100,7 @@ TEST_F(HVReportingSessionSummaryFileTest, IsWrittenThoughNothingWasPlayed) {
               ElementsAre("sending summary event for reporter 7"));
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, ComesBeforeTheSummaryEvent) {
+TEST_F(SessionSummaryFileTest, ComesBeforeTheSummaryEvent) {
   send({{"foo", 1}});
   platform_.log.clear();
 
@@ -113,7 +113,7 @@ TEST_F(HVReportingSessionSummaryFileTest, ComesBeforeTheSummaryEvent) {
   EXPECT_EQ(texts[3], "sending summary event for reporter 7");
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, ItsPathIsLoggedAtInfoLevel) {
+TEST_F(SessionSummaryFileTest, ItsPathIsLoggedAtInfoLevel) {
   send({{"foo", 1}});
   platform_.log.clear();
 
@@ -124,13 +124,13 @@ TEST_F(HVReportingSessionSummaryFileTest, ItsPathIsLoggedAtInfoLevel) {
   EXPECT_EQ(lines[0].category, "hvrr");
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, AnEmptyHistoryWritesNoFile) {
+TEST_F(SessionSummaryFileTest, AnEmptyHistoryWritesNoFile) {
   session_->stop();
 
   EXPECT_THAT(platform_.files.steps(), IsEmpty());
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, AStopWithoutAStartWritesNoFile) {
+TEST_F(SessionSummaryFileTest, AStopWithoutAStartWritesNoFile) {
   send({{"foo", 1}});
   session_->stop();
 
@@ -140,7 +140,7 @@ TEST_F(HVReportingSessionSummaryFileTest, AStopWithoutAStartWritesNoFile) {
   EXPECT_EQ(platform_.files.files().size(), 1U);
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, ADirectoryThatCannotBeMadeIsLoggedAndTheFileTried) {
+TEST_F(SessionSummaryFileTest, ADirectoryThatCannotBeMadeIsLoggedAndTheFileTried) {
   platform_.files.setDirectoryError(platform::Error{.description = "read-only file system"});
   send({{"foo", 1}});
 
@@ -152,7 +152,7 @@ TEST_F(HVReportingSessionSummaryFileTest, ADirectoryThatCannotBeMadeIsLoggedAndT
   EXPECT_EQ(platform_.files.steps().back(), "commit");
 }
 
-TEST_F(HVReportingSessionSummaryFileTest, AFileThatCannotBeWrittenIsLoggedAndTheStopGoesOn) {
+TEST_F(SessionSummaryFileTest, AFileThatCannotBeWrittenIsLoggedAndTheStopGoesOn) {
   platform_.files.setFileError(platform::Error{.description = "no space left"});
   send({{"foo", 1}});
 

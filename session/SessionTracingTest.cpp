@@ -25,9 +25,9 @@ using Texts = std::vector<std::string>;
 
 constexpr const char* kFile = "/params.plist";
 
-class HVReportingSessionTracingTest : public testing::Test {
+class SessionTracingTest : public testing::Test {
  protected:
-  HVReportingSessionTracingTest() {
+  SessionTracingTest() {
     platform_.featureFlags.set("Acoustat", "Tracing", platform::FakeFeatureFlagService::State::kOn);
     platform_.propertyLists.setFile(
         kFile, Dictionary{{"Children", Array{Dictionary{{"Name", "T"}, {"Children", Array{}}}}}});
@@ -80,7 +80,7 @@ const Texts kFrameworkStart{"trace configuration", "trace session", "trace deleg
 
 // --- Choosing -----------------------------------------------------------------------------------
 
-TEST_F(HVReportingSessionTracingTest, WithoutTheFeatureNothingIsTraced) {
+TEST_F(SessionTracingTest, WithoutTheFeatureNothingIsTraced) {
   platform_.featureFlags.set("Acoustat", "Tracing", platform::FakeFeatureFlagService::State::kOff);
   chooseRunner();
 
@@ -88,10 +88,10 @@ TEST_F(HVReportingSessionTracingTest, WithoutTheFeatureNothingIsTraced) {
   session_->stop();
 
   EXPECT_TRUE(operations().empty());
-  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_FALSE(session_->tracing().startedTracing());
 }
 
-TEST_F(HVReportingSessionTracingTest, OnlyTestSessionsTrace) {
+TEST_F(SessionTracingTest, OnlyTestSessionsTrace) {
   for (const auto type : {AudioServiceType::kHaptics, AudioServiceType::kUnknown}) {
     session_->setServiceType(type);
     chooseRunner();
@@ -102,25 +102,25 @@ TEST_F(HVReportingSessionTracingTest, OnlyTestSessionsTrace) {
   EXPECT_TRUE(operations().empty());
 }
 
-TEST_F(HVReportingSessionTracingTest, WithoutATraceTypeTheFrameworkIsChosen) {
+TEST_F(SessionTracingTest, WithoutATraceTypeTheFrameworkIsChosen) {
   session_->start();
 
   EXPECT_EQ(operations(), kFrameworkStart);
   EXPECT_EQ(platform_.performanceTraces.templates(), std::vector<std::int32_t>{1});
-  EXPECT_TRUE(session_->startedTracing());
+  EXPECT_TRUE(session_->tracing().startedTracing());
 }
 
-TEST_F(HVReportingSessionTracingTest, AnyOtherTraceTypeChoosesTheFramework) {
+TEST_F(SessionTracingTest, AnyOtherTraceTypeChoosesTheFramework) {
   session_->setConfiguration(Dictionary{{HVReportingTraceType, HVReportingTraceTypeArtrace},
                                         {HVReportingMeridelPlistFilePath, kFile}});
 
   session_->start();
 
   EXPECT_EQ(operations(), kFrameworkStart);
-  EXPECT_EQ(session_->traceRunner(), nullptr);
+  EXPECT_EQ(session_->tracing().traceRunner(), nullptr);
 }
 
-TEST_F(HVReportingSessionTracingTest, ATypeInsideAnArrayChoosesTheFramework) {
+TEST_F(SessionTracingTest, ATypeInsideAnArrayChoosesTheFramework) {
   session_->setConfiguration(Dictionary{{HVReportingTraceType, Array{HVReportingTraceTypeKtrace}}});
 
   session_->start();
@@ -130,17 +130,17 @@ TEST_F(HVReportingSessionTracingTest, ATypeInsideAnArrayChoosesTheFramework) {
 
 // --- The runner ---------------------------------------------------------------------------------
 
-TEST_F(HVReportingSessionTracingTest, RunnerRecordsFromStartToStop) {
+TEST_F(SessionTracingTest, RunnerRecordsFromStartToStop) {
   chooseRunner();
 
   session_->start();
-  EXPECT_TRUE(session_->startedTracing());
-  EXPECT_EQ(session_->tracingFileName(), kFile);
-  EXPECT_EQ(session_->traceParams()->name, "T");
-  EXPECT_EQ(session_->traceRunner()->getNumTraces(), 1U);
+  EXPECT_TRUE(session_->tracing().startedTracing());
+  EXPECT_EQ(session_->tracing().tracingFileName(), kFile);
+  EXPECT_EQ(session_->tracing().traceParams()->name, "T");
+  EXPECT_EQ(session_->tracing().traceRunner()->getNumTraces(), 1U);
   session_->stop();
 
-  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_FALSE(session_->tracing().startedTracing());
   EXPECT_EQ(operations(),
             (Texts{"ktrace create", "ktrace completion handler", "ktrace wall times on",
                    "ktrace range 0x21040000 to 0x2104408A", "ktrace start", "ktrace end 0",
@@ -148,7 +148,7 @@ TEST_F(HVReportingSessionTracingTest, RunnerRecordsFromStartToStop) {
   EXPECT_EQ(platform_.resultsFiles.files().size(), 1U);
 }
 
-TEST_F(HVReportingSessionTracingTest, LinkIsAskedForBeforeTheTraceIsSetUp) {
+TEST_F(SessionTracingTest, LinkIsAskedForBeforeTheTraceIsSetUp) {
   chooseRunner();
   session_->setTlmReportingEnabled(true);
 
@@ -163,11 +163,11 @@ TEST_F(HVReportingSessionTracingTest, LinkIsAskedForBeforeTheTraceIsSetUp) {
 }
 
 // A trace may begin and fail while it is asked to start.
-TEST_F(HVReportingSessionTracingTest, SessionIsMarkedAsTracedBeforeTheTraceIsAskedToStart) {
+TEST_F(SessionTracingTest, SessionIsMarkedAsTracedBeforeTheTraceIsAskedToStart) {
   std::vector<std::string> asked;
   platform_.journal.whenRecorded([&](const platform::JournalEntry& entry) {
     if (entry.text != "trace start" && entry.text != "ktrace create") return;
-    EXPECT_TRUE(session_->startedTracing()) << entry.text;
+    EXPECT_TRUE(session_->tracing().startedTracing()) << entry.text;
     asked.push_back(entry.text);
   });
 
@@ -182,7 +182,7 @@ TEST_F(HVReportingSessionTracingTest, SessionIsMarkedAsTracedBeforeTheTraceIsAsk
   EXPECT_EQ(asked, (Texts{"trace start", "ktrace create"}));
 }
 
-TEST_F(HVReportingSessionTracingTest, SettingUpTheRunnerIsLoggedByTheSession) {
+TEST_F(SessionTracingTest, SettingUpTheRunnerIsLoggedByTheSession) {
   chooseRunner();
 
   session_->start();
@@ -193,17 +193,17 @@ TEST_F(HVReportingSessionTracingTest, SettingUpTheRunnerIsLoggedByTheSession) {
   session_->stop();
 }
 
-TEST_F(HVReportingSessionTracingTest, WithoutAPathTheRunnerDoesNotStart) {
+TEST_F(SessionTracingTest, WithoutAPathTheRunnerDoesNotStart) {
   session_->setConfiguration(Dictionary{{HVReportingTraceType, HVReportingTraceTypeKtrace}});
 
   session_->start();
-  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_FALSE(session_->tracing().startedTracing());
   session_->stop();
 
   EXPECT_TRUE(operations().empty());
 }
 
-TEST_F(HVReportingSessionTracingTest, EmptyPathIsLoggedAndNothingStarts) {
+TEST_F(SessionTracingTest, EmptyPathIsLoggedAndNothingStarts) {
   session_->setConfiguration(Dictionary{{HVReportingTraceType, HVReportingTraceTypeKtrace},
                                         {HVReportingMeridelPlistFilePath, ""}});
 
@@ -211,11 +211,11 @@ TEST_F(HVReportingSessionTracingTest, EmptyPathIsLoggedAndNothingStarts) {
 
   EXPECT_THAT(lines(LogLevel::kError, "hvrr"),
               testing::ElementsAre("TracefileName empty. Failed to setup tracing"));
-  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_FALSE(session_->tracing().startedTracing());
   EXPECT_TRUE(operations().empty());
 }
 
-TEST_F(HVReportingSessionTracingTest, SecondStartDoesNotTraceAgain) {
+TEST_F(SessionTracingTest, SecondStartDoesNotTraceAgain) {
   chooseRunner();
   session_->start();
   forgetWhatHappened();
@@ -226,40 +226,40 @@ TEST_F(HVReportingSessionTracingTest, SecondStartDoesNotTraceAgain) {
   session_->stop();
 }
 
-TEST_F(HVReportingSessionTracingTest, NextRunMakesANewRunner) {
+TEST_F(SessionTracingTest, NextRunMakesANewRunner) {
   chooseRunner();
   session_->start();
-  const auto first = session_->traceRunner();
+  const auto first = session_->tracing().traceRunner();
   session_->stop();
 
   session_->start();
 
-  EXPECT_NE(session_->traceRunner(), first);
+  EXPECT_NE(session_->tracing().traceRunner(), first);
   session_->stop();
 }
 
-TEST_F(HVReportingSessionTracingTest, EmptyPathOfALaterRunRecordsTheSameWithANewRunner) {
+TEST_F(SessionTracingTest, EmptyPathOfALaterRunRecordsTheSameWithANewRunner) {
   chooseRunner();
   session_->start();
-  const auto first = session_->traceRunner();
-  const auto params = session_->traceParams();
+  const auto first = session_->tracing().traceRunner();
+  const auto params = session_->tracing().traceParams();
   session_->stop();
   session_->setConfiguration(Dictionary{{HVReportingMeridelPlistFilePath, ""}});
   forgetWhatHappened();
 
   session_->start();
-  EXPECT_TRUE(session_->startedTracing());
+  EXPECT_TRUE(session_->tracing().startedTracing());
   session_->stop();
 
-  EXPECT_NE(session_->traceRunner(), first);
-  EXPECT_EQ(session_->traceParams(), params);
-  EXPECT_EQ(session_->tracingFileName(), kFile);
+  EXPECT_NE(session_->tracing().traceRunner(), first);
+  EXPECT_EQ(session_->tracing().traceParams(), params);
+  EXPECT_EQ(session_->tracing().tracingFileName(), kFile);
   EXPECT_THAT(operations(), testing::Contains("ktrace start"));
   EXPECT_THAT(operations(), testing::Contains("ktrace destroy"));
   EXPECT_EQ(lines(LogLevel::kError, "hvrr"), Texts{"TracefileName empty. Failed to setup tracing"});
 }
 
-TEST_F(HVReportingSessionTracingTest, ResultsHoldTheValuesOfTheirOwnRunOnly) {
+TEST_F(SessionTracingTest, ResultsHoldTheValuesOfTheirOwnRunOnly) {
   platform_.propertyLists.setFile(kFile, paramsOf("IO", "0x21040010", "0x21040014"));
   chooseRunner();
   recordInterval(10, 35);
@@ -279,19 +279,19 @@ TEST_F(HVReportingSessionTracingTest, ResultsHoldTheValuesOfTheirOwnRunOnly) {
   EXPECT_EQ(files[1].measurements[0].value, 60);
 }
 
-TEST_F(HVReportingSessionTracingTest, RunnerAndParametersStayWithTheSessionAfterTheStop) {
+TEST_F(SessionTracingTest, RunnerAndParametersStayWithTheSessionAfterTheStop) {
   chooseRunner();
   session_->start();
-  const auto runner = session_->traceRunner();
+  const auto runner = session_->tracing().traceRunner();
   session_->stop();
 
-  EXPECT_EQ(session_->traceRunner(), runner);
-  EXPECT_EQ(session_->traceParams()->name, "T");
+  EXPECT_EQ(session_->tracing().traceRunner(), runner);
+  EXPECT_EQ(session_->tracing().traceParams()->name, "T");
 }
 
 // --- The framework ------------------------------------------------------------------------------
 
-TEST_F(HVReportingSessionTracingTest, FrameworkTraceEndsWithItsURL) {
+TEST_F(SessionTracingTest, FrameworkTraceEndsWithItsURL) {
   platform_.performanceTraces.completeAtStop("file:///traces/one");
   session_->start();
   letRun();
@@ -300,22 +300,22 @@ TEST_F(HVReportingSessionTracingTest, FrameworkTraceEndsWithItsURL) {
   session_->stop();
 
   EXPECT_EQ(operations(), (Texts{"trace stop", "trace without delegate"}));
-  EXPECT_EQ(session_->getKQTraceFileURL(), "file:///traces/one");
-  EXPECT_EQ(session_->traceSession(), nullptr);
-  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_EQ(session_->tracing().getKQTraceFileURL(), "file:///traces/one");
+  EXPECT_EQ(session_->tracing().traceSession(), nullptr);
+  EXPECT_FALSE(session_->tracing().startedTracing());
   EXPECT_EQ(lines(LogLevel::kInfo, "hvrt"),
             (Texts{"Performance Trace Stopped", "Performance Trace Completed: /traces/one"}));
 }
 
 // Whoever waits for the trace goes on at the signal: the trace is forgotten before, and its URL
 // comes after.
-TEST_F(HVReportingSessionTracingTest, CompletionForgetsTheTraceThenSignalsThenStoresTheURL) {
+TEST_F(SessionTracingTest, CompletionForgetsTheTraceThenSignalsThenStoresTheURL) {
   session_->start();
   forgetWhatHappened();
   std::vector<std::optional<std::string>> urls;
   platform_.dispatch.whenSignalled([&] {
-    urls.push_back(session_->getKQTraceFileURL());
-    EXPECT_EQ(session_->traceSession(), nullptr);
+    urls.push_back(session_->tracing().getKQTraceFileURL());
+    EXPECT_EQ(session_->tracing().traceSession(), nullptr);
     EXPECT_EQ(operations(), Texts{"trace without delegate"});
     EXPECT_TRUE(platform_.log.lines().empty());
   });
@@ -323,10 +323,10 @@ TEST_F(HVReportingSessionTracingTest, CompletionForgetsTheTraceThenSignalsThenSt
   platform_.performanceTraces.delegate()->kqTraceDidComplete("file:///one", 0, std::nullopt);
 
   EXPECT_EQ(urls, (std::vector<std::optional<std::string>>{std::nullopt}));
-  EXPECT_EQ(session_->getKQTraceFileURL(), "file:///one");
+  EXPECT_EQ(session_->tracing().getKQTraceFileURL(), "file:///one");
 }
 
-TEST_F(HVReportingSessionTracingTest, StartOfATraceIsToldInTheGeneralLogToo) {
+TEST_F(SessionTracingTest, StartOfATraceIsToldInTheGeneralLogToo) {
   session_->start();
   EXPECT_TRUE(lines(LogLevel::kInfo, "hvrt").empty());
 
@@ -337,19 +337,19 @@ TEST_F(HVReportingSessionTracingTest, StartOfATraceIsToldInTheGeneralLogToo) {
   EXPECT_EQ(platform_.log.lines(LogLevel::kDefault).back().line, "started performance trace.");
 }
 
-TEST_F(HVReportingSessionTracingTest, FailedStartClearsTheTraceButStaysStarted) {
+TEST_F(SessionTracingTest, FailedStartClearsTheTraceButStaysStarted) {
   platform_.performanceTraces.failStarts("no recorder");
   session_->start();
 
   letRun();
 
-  EXPECT_EQ(session_->traceSession(), nullptr);
-  EXPECT_EQ(session_->traceConfig(), nullptr);
-  EXPECT_TRUE(session_->startedTracing());
+  EXPECT_EQ(session_->tracing().traceSession(), nullptr);
+  EXPECT_EQ(session_->tracing().traceConfig(), nullptr);
+  EXPECT_TRUE(session_->tracing().startedTracing());
   EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidStart no recorder"});
 }
 
-TEST_F(HVReportingSessionTracingTest, StopAfterAFailedStartWaitsForWhatNeverComes) {
+TEST_F(SessionTracingTest, StopAfterAFailedStartWaitsForWhatNeverComes) {
   platform_.performanceTraces.failStarts("no recorder");
   session_->start();
   letRun();
@@ -361,19 +361,19 @@ TEST_F(HVReportingSessionTracingTest, StopAfterAFailedStartWaitsForWhatNeverCome
   EXPECT_TRUE(operations().empty());
 }
 
-TEST_F(HVReportingSessionTracingTest, FailedStopClearsTheTrace) {
+TEST_F(SessionTracingTest, FailedStopClearsTheTrace) {
   session_->start();
 
   platform_.performanceTraces.delegate()->kqTraceDidStop(Error{.description = "disk"});
 
-  EXPECT_EQ(session_->traceSession(), nullptr);
-  EXPECT_NE(session_->traceConfig(), nullptr);
+  EXPECT_EQ(session_->tracing().traceSession(), nullptr);
+  EXPECT_NE(session_->tracing().traceConfig(), nullptr);
   EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidStop disk"});
 }
 
 // The end of a trace is the last thing that a stop waits for: from there on this thread holds the
 // history. The stop cannot take it, and the session stays marked as started all the while.
-TEST_F(HVReportingSessionTracingTest, StopClearsTheFlagWhenTheHistoryIsGone) {
+TEST_F(SessionTracingTest, StopClearsTheFlagWhenTheHistoryIsGone) {
   constexpr int kRounds = 10;
   constexpr int kYields = 50;
   platform_.performanceTraces.completeAtStop("file:///one");
@@ -399,17 +399,17 @@ TEST_F(HVReportingSessionTracingTest, StopClearsTheFlagWhenTheHistoryIsGone) {
   }
 }
 
-TEST_F(HVReportingSessionTracingTest, CompletionWithAnErrorEndsTheWaitWithoutAURL) {
+TEST_F(SessionTracingTest, CompletionWithAnErrorEndsTheWaitWithoutAURL) {
   platform_.performanceTraces.failSaves("not saved");
   session_->start();
 
   session_->stop();  // would stand still without the signal
 
-  EXPECT_EQ(session_->getKQTraceFileURL(), std::nullopt);
+  EXPECT_EQ(session_->tracing().getKQTraceFileURL(), std::nullopt);
   EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidComplete not saved"});
 }
 
-TEST_F(HVReportingSessionTracingTest, BackEndIsChosenAgainAtTheStop) {
+TEST_F(SessionTracingTest, BackEndIsChosenAgainAtTheStop) {
   session_->start();
   chooseRunner();  // the framework records, but now the runner is chosen, and there is none
   forgetWhatHappened();
@@ -417,10 +417,10 @@ TEST_F(HVReportingSessionTracingTest, BackEndIsChosenAgainAtTheStop) {
   session_->stop();
 
   EXPECT_TRUE(operations().empty());
-  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_FALSE(session_->tracing().startedTracing());
 }
 
-TEST_F(HVReportingSessionTracingTest, FinishedRunnerIsNotStoppedInPlaceOfTheFrameworksTrace) {
+TEST_F(SessionTracingTest, FinishedRunnerIsNotStoppedInPlaceOfTheFrameworksTrace) {
   chooseRunner();
   session_->start();
   session_->stop();
@@ -434,11 +434,11 @@ TEST_F(HVReportingSessionTracingTest, FinishedRunnerIsNotStoppedInPlaceOfTheFram
 
   EXPECT_TRUE(operations().empty());
   EXPECT_FALSE(session_->started());
-  EXPECT_FALSE(session_->startedTracing());
+  EXPECT_FALSE(session_->tracing().startedTracing());
   EXPECT_EQ(platform_.resultsFiles.files().size(), 1U);
 }
 
-TEST_F(HVReportingSessionTracingTest, ATraceThatNoStopEndedIsGivenUpForTheNextOne) {
+TEST_F(SessionTracingTest, ATraceThatNoStopEndedIsGivenUpForTheNextOne) {
   session_->start();
   letRun();
   chooseRunner();
@@ -454,24 +454,24 @@ TEST_F(HVReportingSessionTracingTest, ATraceThatNoStopEndedIsGivenUpForTheNextOn
   EXPECT_EQ(platform_.performanceTraces.recordings(), 0U);
 }
 
-TEST_F(HVReportingSessionTracingTest, NothingIsHeardOfATraceThatWasReplaced) {
+TEST_F(SessionTracingTest, NothingIsHeardOfATraceThatWasReplaced) {
   platform_.performanceTraces.failStarts("no recorder");
   session_->start();
   chooseRunner();
   session_->stop();
   chooseFramework();
   session_->start();  // both starts are still to come
-  const auto second = session_->traceSession();
+  const auto second = session_->tracing().traceSession();
   platform_.performanceTraces.failStarts("");
 
   letRun();
 
-  EXPECT_EQ(session_->traceSession(), second);
+  EXPECT_EQ(session_->tracing().traceSession(), second);
   EXPECT_EQ(lines(LogLevel::kInfo, "hvrt"), Texts{"Performance Trace Started"});
   session_->stop();
 }
 
-TEST_F(HVReportingSessionTracingTest, StopOfTheFrameworkWhileTheRunnerRecordsWaitsForATrace) {
+TEST_F(SessionTracingTest, StopOfTheFrameworkWhileTheRunnerRecordsWaitsForATrace) {
   chooseRunner();
   session_->start();
   letRun();
@@ -483,7 +483,7 @@ TEST_F(HVReportingSessionTracingTest, StopOfTheFrameworkWhileTheRunnerRecordsWai
   EXPECT_TRUE(session_->started());
 }
 
-TEST_F(HVReportingSessionTracingTest, NothingRecordsForASessionThatIsGone) {
+TEST_F(SessionTracingTest, NothingRecordsForASessionThatIsGone) {
   for (const bool isRunner : {true, false}) {
     isRunner ? chooseRunner() : chooseFramework();
     session_->start();
@@ -503,7 +503,7 @@ TEST_F(HVReportingSessionTracingTest, NothingRecordsForASessionThatIsGone) {
 
 // --- Hooks --------------------------------------------------------------------------------------
 
-TEST_F(HVReportingSessionTracingTest, FeatureSwitchedOffMeanwhileLeavesTheTraceAlone) {
+TEST_F(SessionTracingTest, FeatureSwitchedOffMeanwhileLeavesTheTraceAlone) {
   session_->start();
   platform_.featureFlags.set("Acoustat", "Tracing", platform::FakeFeatureFlagService::State::kOff);
   forgetWhatHappened();
@@ -511,10 +511,10 @@ TEST_F(HVReportingSessionTracingTest, FeatureSwitchedOffMeanwhileLeavesTheTraceA
   session_->stop();
 
   EXPECT_TRUE(operations().empty());
-  EXPECT_TRUE(session_->startedTracing());
+  EXPECT_TRUE(session_->tracing().startedTracing());
 }
 
-TEST_F(HVReportingSessionTracingTest, SessionThatIsNoTestAnyMoreLeavesTheTraceAlone) {
+TEST_F(SessionTracingTest, SessionThatIsNoTestAnyMoreLeavesTheTraceAlone) {
   session_->start();
   session_->setServiceType(AudioServiceType::kHaptics);
   forgetWhatHappened();
@@ -522,10 +522,10 @@ TEST_F(HVReportingSessionTracingTest, SessionThatIsNoTestAnyMoreLeavesTheTraceAl
   session_->stop();
 
   EXPECT_TRUE(operations().empty());
-  EXPECT_TRUE(session_->startedTracing());
+  EXPECT_TRUE(session_->tracing().startedTracing());
 }
 
-TEST_F(HVReportingSessionTracingTest, NextRunDoesNotTraceAgainWhatIsStillTraced) {
+TEST_F(SessionTracingTest, NextRunDoesNotTraceAgainWhatIsStillTraced) {
   session_->start();
   session_->setServiceType(AudioServiceType::kHaptics);
   session_->stop();
@@ -537,7 +537,7 @@ TEST_F(HVReportingSessionTracingTest, NextRunDoesNotTraceAgainWhatIsStillTraced)
   EXPECT_TRUE(operations().empty());
 }
 
-TEST_F(HVReportingSessionTracingTest, StopWaitsForTheTraceBehindTheLinkBeforeTheRunEnds) {
+TEST_F(SessionTracingTest, StopWaitsForTheTraceBehindTheLinkBeforeTheRunEnds) {
   session_->setTlmReportingEnabled(true);
   session_->start();
   session_->sendMessage(Dictionary{{"a", 1}}, AudioEventCategory::kPlayback, AudioEventType::kStart,

@@ -20,22 +20,22 @@ using platform::Value;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-class HVReportingSessionSummaryTest : public SummaryFixture {};
+class SessionSummaryTest : public SummaryFixture {};
 
 // --- the summary event --------------------------------------------------------------------------
 
-TEST_F(HVReportingSessionSummaryTest, AnEmptyHistoryHasNoSummary) {
+TEST_F(SessionSummaryTest, AnEmptyHistoryHasNoSummary) {
   EXPECT_EQ(session_->createSummaryEventForSession(), std::nullopt);
 }
 
-TEST_F(HVReportingSessionSummaryTest, ASessionThatIsNotStartedHasNoSummary) {
+TEST_F(SessionSummaryTest, ASessionThatIsNotStartedHasNoSummary) {
   send({{"foo", 1}});
   session_->stop();
 
   EXPECT_EQ(session_->createSummaryEventForSession(), std::nullopt);
 }
 
-TEST_F(HVReportingSessionSummaryTest, JoinsTheValuesOfAKeyInOrderOfTheHistory) {
+TEST_F(SessionSummaryTest, JoinsTheValuesOfAKeyInOrderOfTheHistory) {
   send({{"foo", 1}});
   send({{"foo", 2}});
 
@@ -45,7 +45,7 @@ TEST_F(HVReportingSessionSummaryTest, JoinsTheValuesOfAKeyInOrderOfTheHistory) {
                                {"audiotag", "PlaybackStart,PlaybackStart"}}));
 }
 
-TEST_F(HVReportingSessionSummaryTest, KeysThatOnlySomeMessagesHaveAreJoinedToo) {
+TEST_F(SessionSummaryTest, KeysThatOnlySomeMessagesHaveAreJoinedToo) {
   send({{"foo", 1}, {"bar", "x"}});
   send({{"other", true}});
   send({{"bar", "y"}, {"foo", 2}});
@@ -57,7 +57,7 @@ TEST_F(HVReportingSessionSummaryTest, KeysThatOnlySomeMessagesHaveAreJoinedToo) 
   EXPECT_EQ(*summary.find("other"), Value("1"));
 }
 
-TEST_F(HVReportingSessionSummaryTest, NumbersAreInTheirShortestForm) {
+TEST_F(SessionSummaryTest, NumbersAreInTheirShortestForm) {
   send({{"n", 0.1}});
   send({{"n", 48000.0}});
   send({{"n", std::int64_t{-7}}});
@@ -66,7 +66,7 @@ TEST_F(HVReportingSessionSummaryTest, NumbersAreInTheirShortestForm) {
   EXPECT_EQ(*session_->createSummaryEventForSession()->find("n"), Value("0.1,48000,-7,0.33333334"));
 }
 
-TEST_F(HVReportingSessionSummaryTest, ContainersAreShownAsTheLogShowsThem) {
+TEST_F(SessionSummaryTest, ContainersAreShownAsTheLogShowsThem) {
   send({{"list", platform::Array{1, "x"}}});
   send({{"list", Dictionary{{"k", 2}}}});
   send({{"list", ""}});
@@ -74,7 +74,7 @@ TEST_F(HVReportingSessionSummaryTest, ContainersAreShownAsTheLogShowsThem) {
   EXPECT_EQ(*session_->createSummaryEventForSession()->find("list"), Value("(1, x),{k = 2},"));
 }
 
-TEST_F(HVReportingSessionSummaryTest, AClientsOwnSummaryKeyFollowsTheServiceType) {
+TEST_F(SessionSummaryTest, AClientsOwnSummaryKeyFollowsTheServiceType) {
   send({{"HV_Session_Summary_Event", "mine"}});
 
   EXPECT_EQ(*session_->createSummaryEventForSession()->find("HV_Session_Summary_Event"),
@@ -83,7 +83,7 @@ TEST_F(HVReportingSessionSummaryTest, AClientsOwnSummaryKeyFollowsTheServiceType
 
 // --- stop ---------------------------------------------------------------------------------------
 
-TEST_F(HVReportingSessionSummaryTest, StopOfAnEmptyRunTellsNothing) {
+TEST_F(SessionSummaryTest, StopOfAnEmptyRunTellsNothing) {
   platform_.journal.clear();
 
   session_->stop();
@@ -92,7 +92,7 @@ TEST_F(HVReportingSessionSummaryTest, StopOfAnEmptyRunTellsNothing) {
               ElementsAre("ending session 7", "ending session 7", "0x21044830"));
 }
 
-TEST_F(HVReportingSessionSummaryTest, StopWithoutStartTellsNothing) {
+TEST_F(SessionSummaryTest, StopWithoutStartTellsNothing) {
   session_->stop();
   platform_.journal.clear();
 
@@ -101,7 +101,7 @@ TEST_F(HVReportingSessionSummaryTest, StopWithoutStartTellsNothing) {
   EXPECT_THAT(platform_.journal.texts(), ElementsAre("ending session 7"));
 }
 
-TEST_F(HVReportingSessionSummaryTest, WithoutVolumeThereIsASummaryEventAlone) {
+TEST_F(SessionSummaryTest, WithoutVolumeThereIsASummaryEventAlone) {
   send({{"foo", 1}});
   platform_.journal.clear();
   platform_.log.clear();
@@ -117,7 +117,7 @@ TEST_F(HVReportingSessionSummaryTest, WithoutVolumeThereIsASummaryEventAlone) {
   EXPECT_EQ(platform_.log.lines().back().category, "hvrr");
 }
 
-TEST_F(HVReportingSessionSummaryTest, StopStepsInOrder) {
+TEST_F(SessionSummaryTest, StopStepsInOrder) {
   playTwoVolumes();
   platform_.analytics.wantOnly({"com.tarno.halvox.Volume.Summary"});
   platform_.journal.clear();
@@ -135,7 +135,7 @@ TEST_F(HVReportingSessionSummaryTest, StopStepsInOrder) {
                           "sending summary event for reporter 7", send, "0x21044838"));
 }
 
-TEST_F(HVReportingSessionSummaryTest, VolumeIsLoggedAtDefaultLevelOnce) {
+TEST_F(SessionSummaryTest, VolumeIsLoggedAtDefaultLevelOnce) {
   playTwoVolumes();
   platform_.log.clear();
 
@@ -146,7 +146,7 @@ TEST_F(HVReportingSessionSummaryTest, VolumeIsLoggedAtDefaultLevelOnce) {
       ElementsAre("sending volume event for reporter 7", "sending summary event for reporter 7"));
 }
 
-TEST_F(HVReportingSessionSummaryTest, AnalyticsGetTheVolumeMessagesUntagged) {
+TEST_F(SessionSummaryTest, AnalyticsGetTheVolumeMessagesUntagged) {
   playTwoVolumes();
 
   session_->stop();
@@ -164,7 +164,7 @@ TEST_F(HVReportingSessionSummaryTest, AnalyticsGetTheVolumeMessagesUntagged) {
   EXPECT_EQ(*events[1].payload->find("RQSessionVolume"), Value(0.75));
 }
 
-TEST_F(HVReportingSessionSummaryTest, AnalyticsGetNoSummaryEvent) {
+TEST_F(SessionSummaryTest, AnalyticsGetNoSummaryEvent) {
   send({{"foo", 1}});
 
   session_->stop();
@@ -173,7 +173,7 @@ TEST_F(HVReportingSessionSummaryTest, AnalyticsGetNoSummaryEvent) {
 }
 
 // The minimum playing time is half a second.
-TEST_F(HVReportingSessionSummaryTest, VolumesOfHalfASecondAreNotReported) {
+TEST_F(SessionSummaryTest, VolumesOfHalfASecondAreNotReported) {
   playing(0.5, 10);
   playing(0.75, 10.5);
   silent(11.25);
@@ -185,7 +185,7 @@ TEST_F(HVReportingSessionSummaryTest, VolumesOfHalfASecondAreNotReported) {
   EXPECT_EQ(*events[0].payload->find("RQSessionVolume"), Value(0.75));
 }
 
-TEST_F(HVReportingSessionSummaryTest, TheLinkGetsVolumeMessagesThenTheSummaryThenTheFlush) {
+TEST_F(SessionSummaryTest, TheLinkGetsVolumeMessagesThenTheSummaryThenTheFlush) {
   session_->stop();
   session_->setTlmReportingEnabled(true);
   platform_.tlmReporting.answerDiscoveries(platform::FakeTlmReportingService::Answering::kLater,
@@ -205,7 +205,7 @@ TEST_F(HVReportingSessionSummaryTest, TheLinkGetsVolumeMessagesThenTheSummaryThe
             Value("UndefinedUnknown"));
 }
 
-TEST_F(HVReportingSessionSummaryTest, TheSummaryHasAllBitsOfItsCategoryAndTypeSet) {
+TEST_F(SessionSummaryTest, TheSummaryHasAllBitsOfItsCategoryAndTypeSet) {
   session_->stop();
   session_->setTlmReportingEnabled(true);
   platform_.tlmReporting.answerDiscoveries(platform::FakeTlmReportingService::Answering::kLater,
@@ -223,7 +223,7 @@ TEST_F(HVReportingSessionSummaryTest, TheSummaryHasAllBitsOfItsCategoryAndTypeSe
       1);
 }
 
-TEST_F(HVReportingSessionSummaryTest, VolumesThatNeverPlayedSendNoVolumeEvent) {
+TEST_F(SessionSummaryTest, VolumesThatNeverPlayedSendNoVolumeEvent) {
   sendVolume(0.5, 0, 10);
   sendVolume(0.75, 0, 20);
   sendVolume(0.5, 0, 30);
@@ -235,7 +235,7 @@ TEST_F(HVReportingSessionSummaryTest, VolumesThatNeverPlayedSendNoVolumeEvent) {
   EXPECT_THAT(platform_.analytics.sentNames(), IsEmpty());
 }
 
-TEST_F(HVReportingSessionSummaryTest, TheSummaryCoversTheVolumeMessages) {
+TEST_F(SessionSummaryTest, TheSummaryCoversTheVolumeMessages) {
   session_->setTlmReportingEnabled(true);
   playTwoVolumes();
   platform_.tlmReporting.answerDiscoveries(platform::FakeTlmReportingService::Answering::kLater,
@@ -252,7 +252,7 @@ TEST_F(HVReportingSessionSummaryTest, TheSummaryCoversTheVolumeMessages) {
   EXPECT_EQ(*summary.find("RQSessionVolume"), Value("0.5,0.75,0.75,0.5,0.75"));
 }
 
-TEST_F(HVReportingSessionSummaryTest, EqualVolumeMessagesInARowAreRecordedOnce) {
+TEST_F(SessionSummaryTest, EqualVolumeMessagesInARowAreRecordedOnce) {
   playing(0.5, 10);
   silent(20);
   playing(0.5, 30);
@@ -265,7 +265,7 @@ TEST_F(HVReportingSessionSummaryTest, EqualVolumeMessagesInARowAreRecordedOnce) 
   EXPECT_EQ(platform_.analytics.events("com.tarno.halvox.Volume.Summary").size(), 2U);
 }
 
-TEST_F(HVReportingSessionSummaryTest, OnOtherThanInternalBuildsNoFileIsWritten) {
+TEST_F(SessionSummaryTest, OnOtherThanInternalBuildsNoFileIsWritten) {
   send({{"foo", 1}});
 
   session_->stop();

@@ -15,11 +15,11 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using namespace std::chrono_literals;
 
-class HVReportingSessionLinkTest : public LinkFixture {};
+class SessionLinkTest : public LinkFixture {};
 
 // --- start --------------------------------------------------------------------------------------
 
-TEST_F(HVReportingSessionLinkTest, StartOnlySubmitsItsJob) {
+TEST_F(SessionLinkTest, StartOnlySubmitsItsJob) {
   session_->start();
 
   EXPECT_THAT(frameworkSteps(), IsEmpty());
@@ -28,7 +28,7 @@ TEST_F(HVReportingSessionLinkTest, StartOnlySubmitsItsJob) {
               ElementsAre(platform::JobWeight::kMayBlock));
 }
 
-TEST_F(HVReportingSessionLinkTest, ASessionWithoutTheLinkHasNoQueueAndAsksForNothing) {
+TEST_F(SessionLinkTest, ASessionWithoutTheLinkHasNoQueueAndAsksForNothing) {
   session_->setTlmReportingEnabled(false);
 
   start();
@@ -39,7 +39,7 @@ TEST_F(HVReportingSessionLinkTest, ASessionWithoutTheLinkHasNoQueueAndAsksForNot
   EXPECT_THAT(frameworkSteps(), IsEmpty());
 }
 
-TEST_F(HVReportingSessionLinkTest, StartJobStepsInOrder) {
+TEST_F(SessionLinkTest, StartJobStepsInOrder) {
   holdDiscoveries();
   platform_.journal.clear();
   platform_.log.clear();
@@ -53,7 +53,7 @@ TEST_F(HVReportingSessionLinkTest, StartJobStepsInOrder) {
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting));
 }
 
-TEST_F(HVReportingSessionLinkTest, LinesGoToTheLinksCategoryUnderTheSessionsName) {
+TEST_F(SessionLinkTest, LinesGoToTheLinksCategoryUnderTheSessionsName) {
   platform_.log.clear();
 
   start();
@@ -64,7 +64,7 @@ TEST_F(HVReportingSessionLinkTest, LinesGoToTheLinksCategoryUnderTheSessionsName
   EXPECT_EQ(line.line.substr(0, 26), "       HVReportingSession:");
 }
 
-TEST_F(HVReportingSessionLinkTest, TheSessionInfoTellsWhatTheLinkIs) {
+TEST_F(SessionLinkTest, TheSessionInfoTellsWhatTheLinkIs) {
   open();
 
   EXPECT_EQ(framework_.sessions().at(0).sessionInfo,
@@ -79,7 +79,7 @@ TEST_F(HVReportingSessionLinkTest, TheSessionInfoTellsWhatTheLinkIs) {
                         {"TLMReportingUserInfoServiceName", "haptics_session"}}));
 }
 
-TEST_F(HVReportingSessionLinkTest, UseOfInterfacesIsReportedUnbatched) {
+TEST_F(SessionLinkTest, UseOfInterfacesIsReportedUnbatched) {
   session_->setServiceType(AudioServiceType::kAPIUsage);
 
   open();
@@ -89,7 +89,7 @@ TEST_F(HVReportingSessionLinkTest, UseOfInterfacesIsReportedUnbatched) {
   EXPECT_EQ(*info.find("TLMReportingSessionInfoContainsRealtimeEvents"), platform::Value(true));
 }
 
-TEST_F(HVReportingSessionLinkTest, TheApplicationIsTheClientBundleAndTheRestUserInfo) {
+TEST_F(SessionLinkTest, TheApplicationIsTheClientBundleAndTheRestUserInfo) {
   session_->setConfiguration(
       Dictionary{{"HostApplicationDisplayID", "com.example.player"}, {"room", "kitchen"}});
 
@@ -104,7 +104,7 @@ TEST_F(HVReportingSessionLinkTest, TheApplicationIsTheClientBundleAndTheRestUser
                         {"room", "kitchen"}}));
 }
 
-TEST_F(HVReportingSessionLinkTest, AConfigurationOverridesTheUserInfo) {
+TEST_F(SessionLinkTest, AConfigurationOverridesTheUserInfo) {
   session_->setConfiguration(Dictionary{{"TLMReportingUserInfoClientName", "me"}});
 
   open();
@@ -113,7 +113,7 @@ TEST_F(HVReportingSessionLinkTest, AConfigurationOverridesTheUserInfo) {
             platform::Value("me"));
 }
 
-TEST_F(HVReportingSessionLinkTest, TheJobSeesTheSessionAsItWasStarted) {
+TEST_F(SessionLinkTest, TheJobSeesTheSessionAsItWasStarted) {
   session_->start();
   session_->setServiceType(AudioServiceType::kAPIUsage);
   session_->setConfiguration(Dictionary{{"late", true}});
@@ -127,7 +127,7 @@ TEST_F(HVReportingSessionLinkTest, TheJobSeesTheSessionAsItWasStarted) {
   EXPECT_EQ(*made.sessionInfo.find("TLMReportingSessionInfoBatchEvent"), platform::Value(true));
 }
 
-TEST_F(HVReportingSessionLinkTest, ATestSessionNeverReachesTheFramework) {
+TEST_F(SessionLinkTest, ATestSessionNeverReachesTheFramework) {
   session_->setServiceType(AudioServiceType::kTest);
 
   open();
@@ -139,39 +139,39 @@ TEST_F(HVReportingSessionLinkTest, ATestSessionNeverReachesTheFramework) {
   EXPECT_EQ(platform_.statistics.value("link", "dropped: test session"), 2U);  // and the summary
 }
 
-TEST_F(HVReportingSessionLinkTest, BackendsThatAreFoundOpenTheLink) {
+TEST_F(SessionLinkTest, BackendsThatAreFoundOpenTheLink) {
   holdDiscoveries();
   start();
-  EXPECT_FALSE(session_->tlmReportingSessionStarted());
+  EXPECT_FALSE(session_->link().tlmReportingSessionStarted());
 
   platform_.dispatch.advance(8s);
   framework_.answerDiscovery(kServers);
   run();
 
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kList, kContinuing));
-  EXPECT_NE(session_->tlmReportingSession(), nullptr);
-  EXPECT_EQ(session_->tlmReportingAgentToken()->text(), "token 1");
-  EXPECT_TRUE(session_->tlmReportingSessionStarted());
+  EXPECT_NE(session_->link().tlmReportingSession(), nullptr);
+  EXPECT_EQ(session_->link().tlmReportingAgentToken()->text(), "token 1");
+  EXPECT_TRUE(session_->link().tlmReportingSessionStarted());
 }
 
-TEST_F(HVReportingSessionLinkTest, BackendsAreListedAfterTheWaitForThem) {
+TEST_F(SessionLinkTest, BackendsAreListedAfterTheWaitForThem) {
   open();
 
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kList, kContinuing));
-  EXPECT_TRUE(session_->tlmReportingSessionStarted());
+  EXPECT_TRUE(session_->link().tlmReportingSessionStarted());
 }
 
 // The framework's thread may be faster than the job that asked it.
-TEST_F(HVReportingSessionLinkTest, BackendsFoundBeforeTheDiscoveryReturnsAreListedAfterTheWaitToo) {
+TEST_F(SessionLinkTest, BackendsFoundBeforeTheDiscoveryReturnsAreListedAfterTheWaitToo) {
   framework_.answerDiscoveries(Fake::Answering::kBeforeReturning, kServers);
 
   start();
 
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kList, kContinuing));
-  EXPECT_TRUE(session_->tlmReportingSessionStarted());
+  EXPECT_TRUE(session_->link().tlmReportingSessionStarted());
 }
 
-TEST_F(HVReportingSessionLinkTest, NoBackendsBeforeTheDiscoveryReturnsAreToldAfterTheWaitToo) {
+TEST_F(SessionLinkTest, NoBackendsBeforeTheDiscoveryReturnsAreToldAfterTheWaitToo) {
   framework_.answerDiscoveries(Fake::Answering::kBeforeReturning);
 
   start();
@@ -180,16 +180,16 @@ TEST_F(HVReportingSessionLinkTest, NoBackendsBeforeTheDiscoveryReturnsAreToldAft
   EXPECT_TRUE(holdsNothing());
 }
 
-TEST_F(HVReportingSessionLinkTest, AnEmptyListIsAListAllTheSame) {
+TEST_F(SessionLinkTest, AnEmptyListIsAListAllTheSame) {
   framework_.answerDiscoveries(Fake::Answering::kBeforeReturning, Array{});
 
   start();
 
-  EXPECT_TRUE(session_->tlmReportingSessionStarted());
+  EXPECT_TRUE(session_->link().tlmReportingSessionStarted());
   EXPECT_TRUE(platform_.log.containsText("list of backends ()"));
 }
 
-TEST_F(HVReportingSessionLinkTest, WithoutBackendsTheLinkFails) {
+TEST_F(SessionLinkTest, WithoutBackendsTheLinkFails) {
   holdDiscoveries();
   start();
 
@@ -199,15 +199,15 @@ TEST_F(HVReportingSessionLinkTest, WithoutBackendsTheLinkFails) {
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kNone, kFailed));
   EXPECT_TRUE(holdsNothing());
   EXPECT_EQ(framework_.liveSessions(), 0U);
-  EXPECT_FALSE(session_->tlmReportingSessionStarted());
+  EXPECT_FALSE(session_->link().tlmReportingSessionStarted());
 }
 
-TEST_F(HVReportingSessionLinkTest, WithoutACallbackTheWaitEndsAfterNineSeconds) {
+TEST_F(SessionLinkTest, WithoutACallbackTheWaitEndsAfterNineSeconds) {
   holdDiscoveries();
   start();
 
   platform_.dispatch.advance(8999ms);
-  EXPECT_NE(session_->tlmReportingSession(), nullptr);
+  EXPECT_NE(session_->link().tlmReportingSession(), nullptr);
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting));
 
   platform_.dispatch.advance(1ms);
@@ -215,7 +215,7 @@ TEST_F(HVReportingSessionLinkTest, WithoutACallbackTheWaitEndsAfterNineSeconds) 
   EXPECT_TRUE(holdsNothing());
 }
 
-TEST_F(HVReportingSessionLinkTest, ALateCallbackSetsTheFlagAloneAndSendsNothing) {
+TEST_F(SessionLinkTest, ALateCallbackSetsTheFlagAloneAndSendsNothing) {
   holdDiscoveries();
   start();
   platform_.dispatch.advance(9s);
@@ -224,12 +224,12 @@ TEST_F(HVReportingSessionLinkTest, ALateCallbackSetsTheFlagAloneAndSendsNothing)
   send({{"a", 1}});
   run();
 
-  EXPECT_TRUE(session_->tlmReportingSessionStarted());
+  EXPECT_TRUE(session_->link().tlmReportingSessionStarted());
   EXPECT_TRUE(holdsNothing());
   EXPECT_THAT(framework_.messages(), IsEmpty());
 }
 
-TEST_F(HVReportingSessionLinkTest, ASignalThatCameTooLateFailsTheNextStartAtOnce) {
+TEST_F(SessionLinkTest, ASignalThatCameTooLateFailsTheNextStartAtOnce) {
   holdDiscoveries();
   start();
   platform_.dispatch.advance(9s);
@@ -249,7 +249,7 @@ TEST_F(HVReportingSessionLinkTest, ASignalThatCameTooLateFailsTheNextStartAtOnce
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kFailed));
 }
 
-TEST_F(HVReportingSessionLinkTest, ACallbackAfterTheStopLeavesTheFlagToTheNextStart) {
+TEST_F(SessionLinkTest, ACallbackAfterTheStopLeavesTheFlagToTheNextStart) {
   holdDiscoveries();
   start();
   platform_.dispatch.advance(9s);
@@ -260,11 +260,11 @@ TEST_F(HVReportingSessionLinkTest, ACallbackAfterTheStopLeavesTheFlagToTheNextSt
   start();
 
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kContinuing));
-  EXPECT_NE(session_->tlmReportingSession(), nullptr);
+  EXPECT_NE(session_->link().tlmReportingSession(), nullptr);
 }
 
-TEST_F(HVReportingSessionLinkTest, TheStartedStateCanBeWatched) {
-  const std::atomic<bool>* state = session_->getTLMReportingStartedState();
+TEST_F(SessionLinkTest, TheStartedStateCanBeWatched) {
+  const std::atomic<bool>* state = session_->link().getTLMReportingStartedState();
   EXPECT_FALSE(*state);
 
   open();
@@ -274,7 +274,7 @@ TEST_F(HVReportingSessionLinkTest, TheStartedStateCanBeWatched) {
   EXPECT_FALSE(*state);
 }
 
-TEST_F(HVReportingSessionLinkTest, ACallbackThatNeverComesKeepsNoSession) {
+TEST_F(SessionLinkTest, ACallbackThatNeverComesKeepsNoSession) {
   holdDiscoveries();
   start();
   platform_.dispatch.advance(9s);
@@ -286,7 +286,7 @@ TEST_F(HVReportingSessionLinkTest, ACallbackThatNeverComesKeepsNoSession) {
   EXPECT_EQ(framework_.waitingDiscoveries(), 1U);
 }
 
-TEST_F(HVReportingSessionLinkTest, ACallbackForASessionThatIsGoneOnlyLogs) {
+TEST_F(SessionLinkTest, ACallbackForASessionThatIsGoneOnlyLogs) {
   holdDiscoveries();
   start();
   platform_.dispatch.advance(9s);

@@ -23,9 +23,9 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using namespace std::chrono_literals;
 
-class HVReportingSessionSingleMessageTest : public testing::Test {
+class SingleMessageTest : public testing::Test {
  protected:
-  ~HVReportingSessionSingleMessageTest() override { platform_.dispatch.clear(); }
+  ~SingleMessageTest() override { platform_.dispatch.clear(); }
 
   static void send(AudioServiceType serviceType, const Dictionary& message = {{"a", 1}},
                    const ErrorReply& reply = nullptr) {
@@ -43,14 +43,14 @@ class HVReportingSessionSingleMessageTest : public testing::Test {
   platform::FakePlatform platform_;
 };
 
-TEST_F(HVReportingSessionSingleMessageTest, LogsADeltaOfZeroForOtherServicesThanAlarms) {
+TEST_F(SingleMessageTest, LogsADeltaOfZeroForOtherServicesThanAlarms) {
   send(AudioServiceType::kStandalone);
 
   EXPECT_THAT(platform_.log.texts(LogLevel::kDebug),
               ElementsAre("sending single message after delta 0 for service 5"));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, GoesOutAfterOneSecondOnTheBackgroundQueue) {
+TEST_F(SingleMessageTest, GoesOutAfterOneSecondOnTheBackgroundQueue) {
   send(AudioServiceType::kHaptics);
   platform_.journal.clear();
 
@@ -67,7 +67,7 @@ TEST_F(HVReportingSessionSingleMessageTest, GoesOutAfterOneSecondOnTheBackground
   EXPECT_EQ(platform_.log.lines().back().level, LogLevel::kDebug);
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, AlarmsDrawADeltaBelowAMinute) {
+TEST_F(SingleMessageTest, AlarmsDrawADeltaBelowAMinute) {
   for (int round = 0; round < 200; ++round) send(AudioServiceType::kAlarms);
 
   std::set<int> deltas;
@@ -81,7 +81,7 @@ TEST_F(HVReportingSessionSingleMessageTest, AlarmsDrawADeltaBelowAMinute) {
 }
 
 // One of the sixty is missing from so many draws once in 10^35 runs.
-TEST_F(HVReportingSessionSingleMessageTest, AlarmsDrawEachSecondOfAMinute) {
+TEST_F(SingleMessageTest, AlarmsDrawEachSecondOfAMinute) {
   for (int round = 0; round < 5000; ++round) send(AudioServiceType::kAlarms);
 
   std::set<int> deltas;
@@ -91,14 +91,14 @@ TEST_F(HVReportingSessionSingleMessageTest, AlarmsDrawEachSecondOfAMinute) {
   EXPECT_EQ(*deltas.rbegin(), 59);
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, AlarmsWaitOneSecondWhateverTheDelta) {
+TEST_F(SingleMessageTest, AlarmsWaitOneSecondWhateverTheDelta) {
   for (int round = 0; round < 50; ++round) send(AudioServiceType::kAlarms);
 
   const auto delays = platform_.dispatch.delays();
   EXPECT_EQ(std::ranges::count(delays, std::chrono::nanoseconds(1s)), 50);
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, RepliesWithNoErrorWhenItWasSent) {
+TEST_F(SingleMessageTest, RepliesWithNoErrorWhenItWasSent) {
   std::vector<std::optional<platform::Error>> replies;
   send(AudioServiceType::kHaptics, {}, [&](const auto& error) { replies.push_back(error); });
   EXPECT_THAT(replies, IsEmpty());
@@ -108,7 +108,7 @@ TEST_F(HVReportingSessionSingleMessageTest, RepliesWithNoErrorWhenItWasSent) {
   EXPECT_THAT(replies, ElementsAre(std::nullopt));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, EveryMessageIsAccountedFor) {
+TEST_F(SingleMessageTest, EveryMessageIsAccountedFor) {
   send(AudioServiceType::kHaptics);
   send(AudioServiceType::kHaptics);
   platform_.dispatch.advance(1s);
@@ -122,7 +122,7 @@ TEST_F(HVReportingSessionSingleMessageTest, EveryMessageIsAccountedFor) {
                                     testing::Pair("failed", 1U)));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, TellsTheFrameworkThatItHasNoSession) {
+TEST_F(SingleMessageTest, TellsTheFrameworkThatItHasNoSession) {
   send(AudioServiceType::kHaptics);
   platform_.dispatch.advance(1s);
 
@@ -133,7 +133,7 @@ TEST_F(HVReportingSessionSingleMessageTest, TellsTheFrameworkThatItHasNoSession)
                                               {"TLMReportingSessionInfoSessionID", -1}}));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, TellsTheFrameworkTheServiceAndNothingOfTheUserInfo) {
+TEST_F(SingleMessageTest, TellsTheFrameworkTheServiceAndNothingOfTheUserInfo) {
   send(AudioServiceType::kHaptics);
   platform_.dispatch.advance(1s);
 
@@ -143,7 +143,7 @@ TEST_F(HVReportingSessionSingleMessageTest, TellsTheFrameworkTheServiceAndNothin
                                            {"TLMReportingUserInfoServiceName", "haptics"}}));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, SendsCleanKeysAndTheCategoryWithoutItsDomain) {
+TEST_F(SingleMessageTest, SendsCleanKeysAndTheCategoryWithoutItsDomain) {
   HVReportingSession::sendSingleMessage(
       Dictionary{{"sample rate", 48000}}, AudioEventCategory::kToolbox | AudioEventCategory::kError,
       AudioEventType::kState, AudioServiceType::kHaptics, {}, nullptr);
@@ -158,7 +158,7 @@ TEST_F(HVReportingSessionSingleMessageTest, SendsCleanKeysAndTheCategoryWithoutI
       platform_.log.containsText("message {sample rate = 48000} : category -2147483637 : type 18"));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, NoMessageAtAllIsSentEmpty) {
+TEST_F(SingleMessageTest, NoMessageAtAllIsSentEmpty) {
   HVReportingSession::sendSingleMessage(std::nullopt, AudioEventCategory::kPlayback,
                                         AudioEventType::kStart, AudioServiceType::kHaptics, {},
                                         nullptr);
@@ -169,7 +169,7 @@ TEST_F(HVReportingSessionSingleMessageTest, NoMessageAtAllIsSentEmpty) {
   EXPECT_TRUE(platform_.log.containsText("message (null) : category 4 : type 1"));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, AFailureWithAnErrorIsLoggedAndReplied) {
+TEST_F(SingleMessageTest, AFailureWithAnErrorIsLoggedAndReplied) {
   const platform::Error error{.domain = "link", .code = 3, .description = "no route"};
   platform_.tlmReporting.setOutcome({.sent = false, .error = error});
   std::vector<std::optional<platform::Error>> replies;
@@ -182,7 +182,7 @@ TEST_F(HVReportingSessionSingleMessageTest, AFailureWithAnErrorIsLoggedAndReplie
   EXPECT_THAT(replies, ElementsAre(error));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, AFailureWithoutAnErrorIsSilentAndRepliedWithNone) {
+TEST_F(SingleMessageTest, AFailureWithoutAnErrorIsSilentAndRepliedWithNone) {
   platform_.tlmReporting.setOutcome({.sent = false});
   std::vector<std::optional<platform::Error>> replies;
 
@@ -193,7 +193,7 @@ TEST_F(HVReportingSessionSingleMessageTest, AFailureWithoutAnErrorIsSilentAndRep
   EXPECT_THAT(replies, ElementsAre(std::nullopt));
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, AnyNumberMayWaitAndAllGoOut) {
+TEST_F(SingleMessageTest, AnyNumberMayWaitAndAllGoOut) {
   platform_.log.setLevel(LogLevel::kError);
   const Dictionary large{{"a", std::string(1024 * 1024, 'x')}};
 
@@ -205,7 +205,7 @@ TEST_F(HVReportingSessionSingleMessageTest, AnyNumberMayWaitAndAllGoOut) {
   EXPECT_THAT(platform_.log.texts(LogLevel::kError), IsEmpty());
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, IsChargedToItsSenderUntilTheFrameworkTookIt) {
+TEST_F(SingleMessageTest, IsChargedToItsSenderUntilTheFrameworkTookIt) {
   const auto sender = std::make_shared<ResourceAccount>();
   std::uint64_t whenTaken = 0;
   const ErrorReply reply = [&](const auto&) { whenTaken = sender->use().bytes; };
@@ -221,7 +221,7 @@ TEST_F(HVReportingSessionSingleMessageTest, IsChargedToItsSenderUntilTheFramewor
   EXPECT_EQ(sender->use().bytes, 0U);
 }
 
-TEST_F(HVReportingSessionSingleMessageTest, GoesOutWhenItsSenderHasGone) {
+TEST_F(SingleMessageTest, GoesOutWhenItsSenderHasGone) {
   auto sender = std::make_shared<ResourceAccount>();
   const std::weak_ptr<ResourceAccount> watched = sender;
   HVReportingSession::sendSingleMessage(Dictionary{{"a", 1}}, AudioEventCategory::kPlayback,

@@ -19,11 +19,11 @@ using testing::Pair;
 using testing::UnorderedElementsAre;
 using namespace std::chrono_literals;
 
-class HVReportingSessionLinkMessagesTest : public LinkFixture {};
+class SessionLinkMessagesTest : public LinkFixture {};
 
 // --- messages -----------------------------------------------------------------------------------
 
-TEST_F(HVReportingSessionLinkMessagesTest, MessagesThatWaitedAreSentInOrder) {
+TEST_F(SessionLinkMessagesTest, MessagesThatWaitedAreSentInOrder) {
   holdDiscoveries();
   start();
   send({{"a", 1}});
@@ -40,7 +40,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, MessagesThatWaitedAreSentInOrder) {
                                       Dictionary{{"a", 3}, {"audiotag", "PlaybackStart"}}));
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, MessagesThatWaitedInVainAreDroppedWithoutALine) {
+TEST_F(SessionLinkMessagesTest, MessagesThatWaitedInVainAreDroppedWithoutALine) {
   holdDiscoveries();
   start();
   send({{"a", 1}});
@@ -53,7 +53,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, MessagesThatWaitedInVainAreDroppedWit
   EXPECT_EQ(platform_.statistics.value("link", "dropped: no back-end"), 1U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, ASentMessageIsLoggedAsTheClientGaveIt) {
+TEST_F(SessionLinkMessagesTest, ASentMessageIsLoggedAsTheClientGaveIt) {
   open();
   platform_.log.clear();
 
@@ -72,7 +72,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, ASentMessageIsLoggedAsTheClientGaveIt
   EXPECT_EQ(platform_.log.lines().back().category, "hvrr");
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, AFailureWithAnErrorIsLoggedAndNotRetried) {
+TEST_F(SessionLinkMessagesTest, AFailureWithAnErrorIsLoggedAndNotRetried) {
   open();
   framework_.setOutcome({.sent = false, .error = platform::Error{.description = "no route"}});
   platform_.log.clear();
@@ -85,7 +85,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, AFailureWithAnErrorIsLoggedAndNotRetr
   EXPECT_EQ(framework_.messages().size(), 1U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, AFailureWithoutAnErrorIsSilent) {
+TEST_F(SessionLinkMessagesTest, AFailureWithoutAnErrorIsSilent) {
   open();
   framework_.setOutcome({.sent = false});
   platform_.log.clear();
@@ -97,7 +97,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, AFailureWithoutAnErrorIsSilent) {
   EXPECT_EQ(platform_.statistics.value("link", "failed"), 1U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, ARedundantMessageIsNotSent) {
+TEST_F(SessionLinkMessagesTest, ARedundantMessageIsNotSent) {
   open();
 
   send({{"a", 1}});
@@ -108,7 +108,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, ARedundantMessageIsNotSent) {
   EXPECT_EQ(platform_.statistics.value("link", "suppressed: redundant"), 1U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, ATestSessionThatIsNotStartedSendsASingleMessage) {
+TEST_F(SessionLinkMessagesTest, ATestSessionThatIsNotStartedSendsASingleMessage) {
   session_->setServiceType(AudioServiceType::kTest);
 
   send({{"a", 1}});
@@ -124,7 +124,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, ATestSessionThatIsNotStartedSendsASin
               UnorderedElementsAre(Pair("received", 1U), Pair("handed on: single message", 1U)));
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, ASessionThatBecameATestSendsNoMore) {
+TEST_F(SessionLinkMessagesTest, ASessionThatBecameATestSendsNoMore) {
   open();
   session_->setServiceType(AudioServiceType::kTest);
 
@@ -135,7 +135,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, ASessionThatBecameATestSendsNoMore) {
 }
 
 // The counts say why a message was not sent: of several reasons the first of this order.
-TEST_F(HVReportingSessionLinkMessagesTest, ARepeatCountsAsOneThoughTheLinkIsDown) {
+TEST_F(SessionLinkMessagesTest, ARepeatCountsAsOneThoughTheLinkIsDown) {
   start();  // no server is found
 
   send({{"a", 1}});
@@ -147,7 +147,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, ARepeatCountsAsOneThoughTheLinkIsDown
                                    Pair("dropped: no back-end", 1U)));
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, ARepeatOfATestSessionCountsAsOneOfATestSession) {
+TEST_F(SessionLinkMessagesTest, ARepeatOfATestSessionCountsAsOneOfATestSession) {
   open();
   session_->setServiceType(AudioServiceType::kTest);
 
@@ -159,7 +159,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, ARepeatOfATestSessionCountsAsOneOfATe
               UnorderedElementsAre(Pair("received", 2U), Pair("dropped: test session", 2U)));
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, TheReplyComesAtOnceThoughTheLinkFailsLater) {
+TEST_F(SessionLinkMessagesTest, TheReplyComesAtOnceThoughTheLinkFailsLater) {
   open();
   framework_.setOutcome({.sent = false, .error = platform::Error{.description = "no route"}});
   std::vector<std::optional<platform::Error>> replies;
@@ -172,7 +172,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, TheReplyComesAtOnceThoughTheLinkFails
   EXPECT_EQ(replies.size(), 1U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, BeforeTheStartAMessageIsASingleOne) {
+TEST_F(SessionLinkMessagesTest, BeforeTheStartAMessageIsASingleOne) {
   send({{"a", 1}});
   platform_.dispatch.advance(1s);
 
@@ -185,8 +185,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, BeforeTheStartAMessageIsASingleOne) {
 }
 
 // Whether it was started counts when it is sent, not when its job runs.
-TEST_F(HVReportingSessionLinkMessagesTest,
-       AMessageOfAStartedSessionIsNoSingleOneThoughTheStopOvertakes) {
+TEST_F(SessionLinkMessagesTest, AMessageOfAStartedSessionIsNoSingleOneThoughTheStopOvertakes) {
   framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
   session_->start();
   send({{"a", 1}});
@@ -199,7 +198,7 @@ TEST_F(HVReportingSessionLinkMessagesTest,
   EXPECT_EQ(platform_.dispatch.delayedJobs(), 0U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, EveryMessageIsAccountedFor) {
+TEST_F(SessionLinkMessagesTest, EveryMessageIsAccountedFor) {
   send({{"a", 0}});  // single
   run();
   start();
@@ -221,7 +220,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, EveryMessageIsAccountedFor) {
                            Pair("dropped: no back-end", 2U)));
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, WaitingStartsAndStopsAreChargedWithTheirConfiguration) {
+TEST_F(SessionLinkMessagesTest, WaitingStartsAndStopsAreChargedWithTheirConfiguration) {
   const auto account = std::make_shared<ResourceAccount>();
   session_->chargeTo(account);
   holdDiscoveries();
@@ -239,7 +238,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, WaitingStartsAndStopsAreChargedWithTh
   EXPECT_EQ(account->use().bytes, session_->configuration().memorySize());
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, WhatWaitsIsChargedToTheClientUntilItWasSent) {
+TEST_F(SessionLinkMessagesTest, WhatWaitsIsChargedToTheClientUntilItWasSent) {
   const auto account = std::make_shared<ResourceAccount>();
   session_->chargeTo(account);
   holdDiscoveries();
@@ -254,7 +253,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, WhatWaitsIsChargedToTheClientUntilItW
   EXPECT_EQ(account->use().bytes, history);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, RedundantMessagesThatWaitAreChargedToo) {
+TEST_F(SessionLinkMessagesTest, RedundantMessagesThatWaitAreChargedToo) {
   const auto account = std::make_shared<ResourceAccount>();
   session_->chargeTo(account);
   holdDiscoveries();
@@ -267,7 +266,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, RedundantMessagesThatWaitAreChargedTo
   EXPECT_GE(account->use().bytes, before + std::size_t{10} * sizeof(Dictionary::Entry));
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, WhatATagReplacedIsChargedWhileItWaits) {
+TEST_F(SessionLinkMessagesTest, WhatATagReplacedIsChargedWhileItWaits) {
   const auto account = std::make_shared<ResourceAccount>();
   session_->chargeTo(account);
   holdDiscoveries();
@@ -278,7 +277,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, WhatATagReplacedIsChargedWhileItWaits
   EXPECT_GE(account->use().bytes, 100'000U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, WhatWaitsStaysChargedWhenTheSessionIsStopped) {
+TEST_F(SessionLinkMessagesTest, WhatWaitsStaysChargedWhenTheSessionIsStopped) {
   const auto account = std::make_shared<ResourceAccount>();
   session_->chargeTo(account);
   holdDiscoveries();
@@ -295,7 +294,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, WhatWaitsStaysChargedWhenTheSessionIs
 
 // --- stop ---------------------------------------------------------------------------------------
 
-TEST_F(HVReportingSessionLinkMessagesTest, StopFlushesBehindAllMessages) {
+TEST_F(SessionLinkMessagesTest, StopFlushesBehindAllMessages) {
   open();
   send({{"a", 1}});
   platform_.journal.clear();
@@ -308,7 +307,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, StopFlushesBehindAllMessages) {
   EXPECT_EQ(framework_.liveSessions(), 0U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, StopLogsAroundTheFlush) {
+TEST_F(SessionLinkMessagesTest, StopLogsAroundTheFlush) {
   open();
   framework_.answerFlushes(Fake::Answering::kWhenTold);
   linkLines();
@@ -321,22 +320,22 @@ TEST_F(HVReportingSessionLinkMessagesTest, StopLogsAroundTheFlush) {
   EXPECT_THAT(linkLines(), ElementsAre(kClosed));
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, TheSessionOfTheFrameworkStaysUntilItIsFlushed) {
+TEST_F(SessionLinkMessagesTest, TheSessionOfTheFrameworkStaysUntilItIsFlushed) {
   open();
   framework_.answerFlushes(Fake::Answering::kWhenTold);
 
   stop();
   platform_.dispatch.advance(1h);
-  EXPECT_NE(session_->tlmReportingSession(), nullptr);
-  EXPECT_TRUE(session_->tlmReportingSessionStarted());
+  EXPECT_NE(session_->link().tlmReportingSession(), nullptr);
+  EXPECT_TRUE(session_->link().tlmReportingSessionStarted());
 
   framework_.completeFlush();
   run();
   EXPECT_TRUE(holdsNothing());
-  EXPECT_FALSE(session_->tlmReportingSessionStarted());
+  EXPECT_FALSE(session_->link().tlmReportingSessionStarted());
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, WhileAFlushIsOutNothingElseOfTheLinkRuns) {
+TEST_F(SessionLinkMessagesTest, WhileAFlushIsOutNothingElseOfTheLinkRuns) {
   open();
   framework_.answerFlushes(Fake::Answering::kWhenTold);
   stop();
@@ -351,7 +350,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, WhileAFlushIsOutNothingElseOfTheLinkR
   EXPECT_EQ(framework_.messages().back().session, 2U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, AFlushTakesNoSignalOfADiscovery) {
+TEST_F(SessionLinkMessagesTest, AFlushTakesNoSignalOfADiscovery) {
   holdDiscoveries();
   start();
   platform_.dispatch.advance(9s);
@@ -368,7 +367,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, AFlushTakesNoSignalOfADiscovery) {
   EXPECT_EQ(framework_.sessions().size(), 3U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, StopWithoutAFrameworkSessionFlushesNothing) {
+TEST_F(SessionLinkMessagesTest, StopWithoutAFrameworkSessionFlushesNothing) {
   start();
   linkLines();
   platform_.journal.clear();
@@ -379,7 +378,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, StopWithoutAFrameworkSessionFlushesNo
   EXPECT_THAT(linkLines(), ElementsAre(kStopEntered, kClosed));
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, StopDuringTheWaitClosesBehindIt) {
+TEST_F(SessionLinkMessagesTest, StopDuringTheWaitClosesBehindIt) {
   holdDiscoveries();
   start();
   session_->stop();
@@ -393,7 +392,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, StopDuringTheWaitClosesBehindIt) {
   EXPECT_EQ(frameworkSteps().back(), "flush session 1");
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, ASessionCanBeStartedAgainWithANewFrameworkSession) {
+TEST_F(SessionLinkMessagesTest, ASessionCanBeStartedAgainWithANewFrameworkSession) {
   open();
   stop();
 
@@ -405,7 +404,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, ASessionCanBeStartedAgainWithANewFram
   EXPECT_EQ(framework_.messages().back().session, 2U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, ASessionThatWaitsDelaysNoOther) {
+TEST_F(SessionLinkMessagesTest, ASessionThatWaitsDelaysNoOther) {
   holdDiscoveries();
   start();
   framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
@@ -421,7 +420,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, ASessionThatWaitsDelaysNoOther) {
   EXPECT_EQ(framework_.messages().at(0).session, 2U);
 }
 
-TEST_F(HVReportingSessionLinkMessagesTest, TheLastJobKeepsTheSessionUntilItIsFlushed) {
+TEST_F(SessionLinkMessagesTest, TheLastJobKeepsTheSessionUntilItIsFlushed) {
   open();
   framework_.answerFlushes(Fake::Answering::kWhenTold);
   stop();
@@ -436,7 +435,7 @@ TEST_F(HVReportingSessionLinkMessagesTest, TheLastJobKeepsTheSessionUntilItIsFlu
 }
 
 // Runs under ThreadSanitizer: discovery answers on a thread of the framework.
-TEST_F(HVReportingSessionLinkMessagesTest, DiscoveryMayAnswerOnAnotherThread) {
+TEST_F(SessionLinkMessagesTest, DiscoveryMayAnswerOnAnotherThread) {
   holdDiscoveries();
   start();
 

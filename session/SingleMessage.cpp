@@ -1,3 +1,5 @@
+#include "session/SingleMessage.h"
+
 #include <chrono>
 #include <optional>
 #include <random>
@@ -8,7 +10,6 @@
 #include "platform/services.h"
 #include "platform/statistics.h"
 #include "platform/tlm_reporting.h"
-#include "session/HVReportingSession.h"
 #include "session/LinkInfo.h"
 #include "session/SessionLog.h"
 #include "session/TracePoints.h"
@@ -21,10 +22,10 @@ using platform::Dictionary;
 constexpr std::chrono::seconds kSingleMessageDelay{1};
 constexpr std::int64_t kNoLinkSession = -1;  // the framework's session ID outside any session
 constexpr int kMaxAlarmDelta = 59;
-// What a waiting message costs beside its content, about: the job and its timer.
+// Estimated bytes of a waiting message's job and timer, in addition to its content.
 constexpr std::size_t kPendingOverhead = 256;
 
-// received = sent + failed + suppressed + those that wait for their second.
+// received = sent + failed + suppressed + the messages that still wait for their second.
 struct SingleMessageCounters {
   platform::Counter& received;
   platform::Counter& sent;
@@ -41,23 +42,16 @@ const SingleMessageCounters& counters() {
   return made;
 }
 
-// Alarms go off everywhere at the same moment, hence the idea of spreading their messages. The
-// delta is drawn and logged, but by intention it delays nothing.
+// Alarms go off on many devices at the same moment, and the delta would spread their messages. It
+// is only logged: every message waits exactly one second. This is required.
 std::int64_t drawDelta(AudioServiceType serviceType) {
   if (serviceType != AudioServiceType::kAlarms) return 0;
   thread_local std::minstd_rand generator{std::random_device{}()};
   return std::uniform_int_distribution<int>(0, kMaxAlarmDelta)(generator);
 }
 
-// One message on its way to the framework.
-struct SingleMessage {
-  platform::Message message;
-  AudioEventCategory category;
-  AudioEventType type;
-  AudioServiceType serviceType;
-};
-
-// Sends the message; the error when there is one to tell.
+// Sends the message. Returns the framework's error, or none if it sent the message or gave no
+// reason.
 std::optional<platform::Error> handOver(const SingleMessage& single) {
   const Dictionary sessionInfo{
       {platform::kTLMReportingSessionInfoClientType, kLinkClientType},
@@ -102,22 +96,21 @@ void sendNow(const SingleMessage& single, const ErrorReply& reply) {
 
 }  // namespace
 
-void HVReportingSession::sendSingleMessage(const platform::Message& message,
-                                           AudioEventCategory category, AudioEventType type,
-                                           AudioServiceType serviceType,
-                                           const platform::Dictionary& /*userInfo*/,
-                                           const ErrorReply& reply, const Account& sender) {
+// The number of waiting messages has no bound of its own. A message that arrives here was already
+// answered, so a bound could only drop what the client believes delivered, and the messages of
+// other clients with it. The account bounds them instead: it makes the connection layer refuse the
+// sender's next requests.
+void submitSingleMessage(SingleMessage single, ErrorReply reply,
+                         const std::shared_ptr<ResourceAccount>& sender) {
   counters().received.add();
-  kSessionLog.debug("sending single message after delta ", drawDelta(serviceType), " for service ",
-                    number(serviceType));
-  // Any number of messages may wait: what a client has waiting is bounded by what may be held for
-  // it, and its requests are refused at that bound, before they are answered. A bound here could
-  // only drop what was answered already, and that of other clients too.
-  ResourceCharge charge(sender, kPendingOverhead + (message ? message->memorySize() : 0));
-  // The job runs in a small pool that all share, and blocks nobody: the framework waits for no
-  // server.
+  kSessionLog.debug("sending single message after delta ", drawDelta(single.serviceType),
+                    " for service ", number(single.serviceType));
+  const std::size_t content = single.message.has_value() ? single.message->memorySize() : 0;
+  ResourceCharge charge(sender, kPendingOverhead + content);
+  // The background pool is small and shared. The job does not hold it up, because the framework
+  // never waits for a server.
   platform::dispatch().asyncAfterOnBackgroundQueue(
-      kSingleMessageDelay, [single = SingleMessage{message, category, type, serviceType}, reply,
+      kSingleMessageDelay, [single = std::move(single), reply = std::move(reply),
                             charge = std::move(charge)] { sendNow(single, reply); });
 }
 

@@ -1,18 +1,19 @@
-#include <string>
+#include "session/SessionTracing.h"
+
+#include <string_view>
 #include <utility>
 
+#include "backends/HVReportingVocabulary.h"
 #include "platform/feature_flags.h"
 #include "platform/log.h"
 #include "platform/services.h"
-#include "session/HVReportingSession.h"
 #include "session/SessionLog.h"
+#include "session/SessionProfile.h"
 #include "session/TraceConstants.h"
 #include "tracing/TraceLog.h"
 #include "tracing/TraceParamsParser.h"
 #include "tracing/TraceRunner.h"
 
-// The performance traces of test sessions: the service's own runner, driven by a trace parameters
-// file, or the platform's performance-trace framework.
 namespace halvox {
 
 const platform::StringConstant HVReportingTraceTypeKtrace{"ktrace"};
@@ -22,10 +23,10 @@ namespace {
 using platform::Error;
 using platform::PerformanceTraceService;
 
-// What the callbacks of the framework log with.
+// The log of the framework's callbacks.
 constexpr platform::UnitLog kTraceLog(&HVReportingTraceCategory, "HVReportingSession");
 
-// The general log of the service, for a plain line of no unit.
+// The general log of the service, for one line without the name of a source.
 platform::LogCategory& generalCategory() {
   static platform::LogCategory& category =
       platform::log().createCategory(kHVReportingLogSubsystem, "general");
@@ -36,8 +37,9 @@ bool isTracingOn() {
   return platform::featureFlags()._os_feature_enabled_impl("Acoustat", "Tracing");
 }
 
-// Whether the runner is chosen. The test is one of identity and kept so: a text that merely spells
-// "ktrace" chooses the framework, and so does no text at all.
+// True if the configuration chooses the runner. Compares the identity of the text, not its
+// spelling, and this is required: any other text that spells "ktrace" chooses the framework, and so
+// does a missing one. A client's text works because the decoder turns "ktrace" into the constant.
 bool choosesRunner(const platform::Dictionary& configuration) {
   const platform::Value* type = configuration.find(HVReportingTraceType);
   return type != nullptr && type->isIdenticalTo(HVReportingTraceTypeKtrace);
@@ -49,7 +51,7 @@ std::shared_ptr<TraceRunner> makeRunner(const TraceParams* params) {
   return runner;
 }
 
-// What follows the scheme of a file's URL.
+// The URL without "file://".
 std::string_view pathOfURL(std::string_view url) {
   constexpr std::string_view kScheme = "file://";
   if (url.starts_with(kScheme)) url.remove_prefix(kScheme.size());
@@ -58,11 +60,18 @@ std::string_view pathOfURL(std::string_view url) {
 
 }  // namespace
 
-void HVReportingSession::startTracing() {
-  if (!isTracingOn() || startedTracing() || serviceType() != AudioServiceType::kTest) return;
-  const platform::Dictionary settings = configuration();
+SessionTracing::SessionTracing(const SessionProfile& profile)
+    : profile_(profile), mTraceDispatchSemaphore_(platform::dispatch().createSemaphore(0)) {}
+
+// The session is marked as traced before the trace is asked to start, because a trace may begin and
+// fail before that call returns.
+void SessionTracing::start(const Owner& owner) {
+  if (!isTracingOn() || startedTracing() || profile_.serviceType() != AudioServiceType::kTest) {
+    return;
+  }
+  const platform::Dictionary settings = profile_.configuration();
   if (!choosesRunner(settings)) {
-    startFrameworkTrace();
+    startFrameworkTrace(owner);
     return;
   }
   const platform::Value* path = settings.find(HVReportingMeridelPlistFilePath);
@@ -76,18 +85,18 @@ void HVReportingSession::startTracing() {
   }
 }
 
-// The one that was just set up. If the set-up failed, the parameters of an earlier run are traced
-// again, by a runner of their own, so that its results are those of this run alone. Null when there
-// are none.
-std::shared_ptr<TraceRunner> HVReportingSession::runnerForThisRun() {
+// The runner that was just set up. If its path was empty, the parameters of an earlier run are
+// traced again. That takes a new runner, because a runner records once and its results must be
+// those of this run alone. Null if no parameters were ever set up.
+std::shared_ptr<TraceRunner> SessionTracing::runnerForThisRun() {
   auto current = traceRunner();
   if (current == nullptr || current->canRun()) return current;
   auto fresh = makeRunner(traceParams().get());
-  tracing_.lock()->runner = fresh;
+  state_.lock()->runner = fresh;
   return fresh;
 }
 
-void HVReportingSession::setupTracing(const std::string& path) {
+void SessionTracing::setupTracing(const std::string& path) {
   if (path.empty()) {
     kSessionLog.error("TracefileName empty. Failed to setup tracing");
     return;
@@ -95,80 +104,84 @@ void HVReportingSession::setupTracing(const std::string& path) {
   auto params = std::make_shared<const TraceParams>(TraceParamsParser(path).loadTraceParams());
   auto runner = makeRunner(params.get());
   {
-    const auto tracing = tracing_.lock();
-    tracing->fileName = path;
-    tracing->params = std::move(params);
-    tracing->runner.swap(runner);  // the former one goes without the lock
+    const auto state = state_.lock();
+    state->fileName = path;
+    state->params = std::move(params);
+    state->runner.swap(runner);  // destroys the former runner after the lock
   }
   setStartedTracing(false);
-  kSessionLog.info("Setting up tracing for ", serviceName());
+  kSessionLog.info("Setting up tracing for ", profile_.serviceName());
 }
 
-void HVReportingSession::startFrameworkTrace() {
+void SessionTracing::startFrameworkTrace(const Owner& owner) {
   PerformanceTraceService& traces = platform::performanceTraces();
   auto config = traces.configWithTemplate(PerformanceTraceService::kStandardTemplate);
   const auto trace = traces.initWithConfig(config);
   auto former = trace;
   {
-    const auto tracing = tracing_.lock();
-    tracing->config = std::move(config);
-    tracing->session.swap(former);
+    const auto state = state_.lock();
+    state->config = std::move(config);
+    state->session.swap(former);
   }
-  // One that was never stopped, because its stop chose the runner, ends with its last holder. What
-  // it still has to say is not about the new one.
+  // The former trace still records if its stop chose the runner. It ends here, with its last
+  // holder. Without a delegate its callbacks cannot be taken for those of the new trace.
   if (former != nullptr) former->setDelegate({});
-  trace->setDelegate(weak_from_this());
+  trace->setDelegate(std::shared_ptr<SessionTracing>(owner, this));
   setStartedTracing(true);
   trace->startKQTrace();
 }
 
-void HVReportingSession::stopTracing() {
-  if (!isTracingOn() || !startedTracing() || serviceType() != AudioServiceType::kTest) return;
+void SessionTracing::stop() {
+  if (!isTracingOn() || !startedTracing() || profile_.serviceType() != AudioServiceType::kTest) {
+    return;
+  }
   setStartedTracing(false);
-  // The type may have changed since the start. A runner that does not record has nothing to stop.
-  if (choosesRunner(configuration())) {
+  // The trace type may have changed since the start. Stopping a runner that does not record does
+  // nothing.
+  if (choosesRunner(profile_.configuration())) {
     if (const auto runner = traceRunner()) runner->stopTracingandProcessResults();
     return;
   }
   if (const auto trace = traceSession()) trace->stopKQTrace();
-  // Until the trace has completed, however long that takes. A trace whose start failed never
-  // completes, and then this never ends: there is no time limit, on purpose.
+  // Waits until the trace has completed, however long that takes. A trace whose start failed never
+  // completes, and then this never returns. That there is no time-out is required.
   mTraceDispatchSemaphore_->wait();
 }
 
-void HVReportingSession::kqTraceDidStart(const std::optional<Error>& error) {
+void SessionTracing::kqTraceDidStart(const std::optional<Error>& error) {
   generalCategory().write(platform::LogLevel::kDefault, "started performance trace.");
   if (!error.has_value()) {
     kTraceLog.info("Performance Trace Started");
     return;
   }
   {
-    const auto tracing = tracing_.lock();
-    tracing->session = nullptr;
-    tracing->config = nullptr;
+    const auto state = state_.lock();
+    state->session = nullptr;
+    state->config = nullptr;
   }
   kTraceLog.error("kqTraceDidStart ", error->description);
 }
 
-void HVReportingSession::kqTraceDidStop(const std::optional<Error>& error) {
+void SessionTracing::kqTraceDidStop(const std::optional<Error>& error) {
   if (!error.has_value()) {
     kTraceLog.info("Performance Trace Stopped");
     return;
   }
-  tracing_.lock()->session = nullptr;
+  state_.lock()->session = nullptr;
   kTraceLog.error("kqTraceDidStop ", error->description);
 }
 
-void HVReportingSession::kqTraceDidComplete(const std::string& url, std::uint64_t /*token*/,
-                                            const std::optional<Error>& error) {
-  const auto trace = std::exchange(tracing_.lock()->session, nullptr);
+void SessionTracing::kqTraceDidComplete(const std::string& url, std::uint64_t /*token*/,
+                                        const std::optional<Error>& error) {
+  // Whoever waits for the signal finds the trace gone, but the URL may come after it.
+  const auto trace = std::exchange(state_.lock()->session, nullptr);
   if (trace != nullptr) trace->setDelegate({});
   mTraceDispatchSemaphore_->signal();
   if (error.has_value()) {
     kTraceLog.error("kqTraceDidComplete ", error->description);
     return;
   }
-  tracing_.lock()->finalURL = url;
+  state_.lock()->finalURL = url;
   kTraceLog.info("Performance Trace Completed: ", pathOfURL(url));
 }
 

@@ -1,7 +1,6 @@
 #include <chrono>
 #include <memory>
 #include <string>
-#include <utility>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -14,9 +13,9 @@ namespace {
 
 using namespace std::chrono_literals;
 
-class HVReportingSessionLinkChargesTest : public LinkFixture {
+class SessionLinkChargesTest : public LinkFixture {
  protected:
-  HVReportingSessionLinkChargesTest() { session_->chargeTo(owner_); }
+  SessionLinkChargesTest() { session_->chargeTo(owner_); }
 
   void sendFromAnother() {
     session_->sendMessage(Dictionary{{"a", std::string(1000, 'x')}}, kPlayback, kStart, nullptr,
@@ -27,7 +26,7 @@ class HVReportingSessionLinkChargesTest : public LinkFixture {
   const std::shared_ptr<ResourceAccount> sender_ = std::make_shared<ResourceAccount>();
 };
 
-TEST_F(HVReportingSessionLinkChargesTest, ASingleMessageOfAnotherClientIsChargedToThatOne) {
+TEST_F(SessionLinkChargesTest, ASingleMessageOfAnotherClientIsChargedToThatOne) {
   sendFromAnother();
   EXPECT_GE(sender_->use().bytes, 1000U) << "in the queue of the link";
   run();
@@ -39,7 +38,7 @@ TEST_F(HVReportingSessionLinkChargesTest, ASingleMessageOfAnotherClientIsCharged
   EXPECT_EQ(framework_.singleMessages().size(), 1U);
 }
 
-TEST_F(HVReportingSessionLinkChargesTest, OwnersPayForTheHistoryAndSendersForWhatWaits) {
+TEST_F(SessionLinkChargesTest, OwnersPayForTheHistoryAndSendersForWhatWaits) {
   holdDiscoveries();
   start();
 
@@ -54,7 +53,7 @@ TEST_F(HVReportingSessionLinkChargesTest, OwnersPayForTheHistoryAndSendersForWha
   EXPECT_EQ(owner_->use().bytes, history);
 }
 
-TEST_F(HVReportingSessionLinkChargesTest, MessagesOfTheSessionItselfAreChargedToItsOwner) {
+TEST_F(SessionLinkChargesTest, MessagesOfTheSessionItselfAreChargedToItsOwner) {
   holdDiscoveries();
   start();
   send({{"a", 1}});
@@ -65,22 +64,6 @@ TEST_F(HVReportingSessionLinkChargesTest, MessagesOfTheSessionItselfAreChargedTo
   run();
 
   EXPECT_EQ(owner_->use().bytes, 0U);
-}
-
-TEST(ResourceChargeTest, IsPaidForAsLongAsItOrACopyLives) {
-  const auto account = std::make_shared<ResourceAccount>();
-  {
-    ResourceCharge charge(account, 100);
-    EXPECT_EQ(account->use().bytes, 100U);
-    ResourceCharge copy = charge;
-    EXPECT_EQ(account->use().bytes, 200U);
-    const ResourceCharge moved = std::move(charge);
-    EXPECT_EQ(account->use().bytes, 200U);
-    copy = ResourceCharge(account, 7);
-    EXPECT_EQ(account->use().bytes, 107U);
-  }
-
-  EXPECT_EQ(account->use().bytes, 0U);
 }
 
 }  // namespace

@@ -1,0 +1,83 @@
+#include "session/SessionHistory.h"
+
+#include <string_view>
+
+#include "platform/services.h"
+#include "platform/statistics.h"
+#include "session/SessionLog.h"
+
+namespace halvox {
+namespace {
+
+// received = recorded + suppressed + not recorded.
+struct MessageCounters {
+  platform::Counter& received;
+  platform::Counter& recorded;
+  platform::Counter& redundant;
+  platform::Counter& notStarted;
+};
+
+const MessageCounters& counters() {
+  constexpr std::string_view kPiece = "session";
+  platform::StatisticsService& statistics = platform::statistics();
+  static const MessageCounters made{statistics.counter(kPiece, "received"),
+                                    statistics.counter(kPiece, "recorded"),
+                                    statistics.counter(kPiece, "suppressed: redundant"),
+                                    statistics.counter(kPiece, "not recorded: not started")};
+  return made;
+}
+
+// Errors are never suppressed, however often they repeat. The category is compared as a whole, so
+// an error category with a domain is not exempt; this is required.
+bool isExemptFromSuppression(AudioEventCategory category, AudioEventType type) {
+  return category == AudioEventCategory::kError || type == AudioEventType::kError;
+}
+
+}  // namespace
+
+void SessionHistory::begin() { history_.set(MessageHistory()); }
+
+std::optional<MessageHistory> SessionHistory::end() {
+  std::optional<MessageHistory> history = history_.take();
+  held_.change(history.has_value() ? history->memorySize() : 0, 0);
+  return history;
+}
+
+std::size_t SessionHistory::size() const {
+  const Lock history = lock();
+  return history->has_value() ? (*history)->size() : 0;
+}
+
+bool SessionHistory::record(AudioEventCategory category, AudioEventType type,
+                            const platform::Dictionary& message) {
+  counters().received.add();
+  const Lock history = lock();
+  const bool isRedundant = recordLocked(history, category, type, message);
+  if (isRedundant) {
+    counters().redundant.add();
+  } else {
+    (history->has_value() ? counters().recorded : counters().notStarted).add();
+  }
+  return isRedundant;
+}
+
+bool SessionHistory::recordLocked(const Lock& history, AudioEventCategory category,
+                                  AudioEventType type, const platform::Dictionary& message) {
+  if (!history->has_value()) return false;
+  MessageHistory& messages = **history;
+  const std::size_t before = messages.memorySize();
+  MessageHistory::Base& base = messages.base(category, type);
+  const platform::Dictionary* previous = messages.newestMessage(base);
+  if (previous != nullptr && !isExemptFromSuppression(category, type) &&
+      equalApartFromVolatileKeys(*previous, message)) {
+    kSessionLog.debug("dropping redundant event");
+    // The history may have grown all the same: by the code under which the base is now known.
+    held_.change(before, messages.memorySize());
+    return true;
+  }
+  messages.append(base, message);
+  held_.change(before, messages.memorySize());
+  return false;
+}
+
+}  // namespace halvox

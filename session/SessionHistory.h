@@ -1,0 +1,50 @@
+#pragma once
+
+#include <cstddef>
+#include <optional>
+
+#include "backends/HVReportingVocabulary.h"
+#include "platform/value.h"
+#include "session/Guarded.h"
+#include "session/MessageHistory.h"
+#include "session/ResourceAccount.h"
+
+namespace halvox {
+
+// The message history of a session's current run. It exists from begin() to end(); outside a run
+// messages are not recorded.
+//
+// Owned by the session. Any thread may call; the history has one lock, which also guards the
+// counts of its identifiers.
+class SessionHistory {
+ public:
+  // The history, locked. Holds none outside a run.
+  using Lock = Guarded<std::optional<MessageHistory>>::Lock;
+
+  // Charges the history to `held`, which must outlive this.
+  explicit SessionHistory(ResourceTally& held) : held_(held) {}
+
+  // Begins a run with an empty history.
+  void begin();
+  // Ends the run and returns its history. The caller destroys it, which for a long history takes
+  // too long to do under the lock.
+  [[nodiscard]] std::optional<MessageHistory> end();
+
+  [[nodiscard]] Lock lock() const { return history_.lock(); }
+  // Number of recorded messages; 0 outside a run.
+  [[nodiscard]] std::size_t size() const;
+
+  // Records a message under its next identifier, unless it repeats the previous message of its
+  // category and type. Returns true if the message was such a repetition. Counts the outcome.
+  bool record(AudioEventCategory category, AudioEventType type,
+              const platform::Dictionary& message);
+  // The same for a caller that holds the lock; not counted. Outside a run returns false.
+  bool recordLocked(const Lock& history, AudioEventCategory category, AudioEventType type,
+                    const platform::Dictionary& message);
+
+ private:
+  ResourceTally& held_;  // the session's
+  Guarded<std::optional<MessageHistory>> history_;
+};
+
+}  // namespace halvox

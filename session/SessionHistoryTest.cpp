@@ -1,0 +1,59 @@
+#include "session/SessionHistory.h"
+
+#include <memory>
+
+#include <gtest/gtest.h>
+
+#include "platform/fake/FakePlatform.h"
+
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+
+constexpr auto kPlayback = AudioEventCategory::kPlayback;
+constexpr auto kStart = AudioEventType::kStart;
+
+class SessionHistoryTest : public testing::Test {
+ protected:
+  SessionHistoryTest() { held_.chargeTo(account_); }
+
+  platform::FakePlatform platform_;
+  const std::shared_ptr<ResourceAccount> account_ = std::make_shared<ResourceAccount>();
+  ResourceTally held_;
+  SessionHistory history_{held_};
+};
+
+TEST_F(SessionHistoryTest, OutsideARunRecordsNothing) {
+  EXPECT_FALSE(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}));
+  EXPECT_FALSE(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}));
+
+  EXPECT_EQ(history_.size(), 0U);
+  EXPECT_FALSE(history_.lock()->has_value());
+  EXPECT_FALSE(history_.end().has_value());
+}
+
+TEST_F(SessionHistoryTest, RepetitionInARunIsRedundant) {
+  history_.begin();
+
+  EXPECT_FALSE(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}));
+  EXPECT_TRUE(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}));
+
+  EXPECT_EQ(history_.size(), 1U);
+}
+
+TEST_F(SessionHistoryTest, EndGivesTheHistoryAwayAndItsChargeBack) {
+  history_.begin();
+  history_.record(kPlayback, kStart, Dictionary{{"a", 1}});
+  EXPECT_GT(account_->use().bytes, 0U);
+
+  const auto ended = history_.end();
+
+  ASSERT_TRUE(ended.has_value());
+  EXPECT_EQ(ended->size(), 1U);
+  EXPECT_EQ(history_.size(), 0U);
+  EXPECT_EQ(account_->use().bytes, 0U);
+}
+
+}  // namespace
+}  // namespace halvox

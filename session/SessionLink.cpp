@@ -1,0 +1,237 @@
+#include "session/SessionLink.h"
+
+#include <chrono>
+#include <string_view>
+#include <utility>
+
+#include "backends/HVReportingUtility.h"
+#include "platform/services.h"
+#include "platform/statistics.h"
+#include "session/LinkDiscovery.h"
+#include "session/LinkInfo.h"
+#include "session/LinkLog.h"
+#include "session/SessionLog.h"
+#include "session/SessionProfile.h"
+#include "session/SingleMessage.h"
+
+namespace halvox {
+namespace {
+
+using platform::Dictionary;
+using platform::JobWeight;
+using platform::WaitOutcome;
+
+constexpr std::string_view kQueueLabel = "com.tarno.halvox.session.tlmreporting";
+constexpr std::chrono::seconds kBackendTimeOut{9};
+// Estimated bytes of a waiting job and its place in the queue, in addition to its content.
+constexpr std::size_t kWaitingOverhead = 256;
+
+// received = sent + failed + single + suppressed + dropped + the messages that wait in the queues.
+struct LinkCounters {
+  platform::Counter& received;
+  platform::Counter& sent;
+  platform::Counter& failed;
+  platform::Counter& single;
+  platform::Counter& redundant;
+  platform::Counter& notAllowed;
+  platform::Counter& testSession;
+  platform::Counter& noBackend;
+};
+
+const LinkCounters& counters() {
+  constexpr std::string_view kPiece = "link";
+  platform::StatisticsService& statistics = platform::statistics();
+  static const LinkCounters made{statistics.counter(kPiece, "received"),
+                                 statistics.counter(kPiece, "sent"),
+                                 statistics.counter(kPiece, "failed"),
+                                 statistics.counter(kPiece, "handed on: single message"),
+                                 statistics.counter(kPiece, "suppressed: redundant"),
+                                 statistics.counter(kPiece, "dropped: transactions not allowed"),
+                                 statistics.counter(kPiece, "dropped: test session"),
+                                 statistics.counter(kPiece, "dropped: no back-end")};
+  return made;
+}
+
+bool mayUseFramework(AudioServiceType serviceType) {
+  return HVReportingUtilityAllowSessionTransactions() && serviceType != AudioServiceType::kTest;
+}
+
+// What a waiting message keeps in memory.
+std::size_t bytesOf(const LinkMessage& message) {
+  std::size_t bytes = kWaitingOverhead + message.tagged.memorySize();
+  if (!message.original.has_value()) return bytes;
+  // The tagged message has one entry more and shares the values of the original, unless cleaning
+  // made two keys equal or replaced a tag: then some values belong to the original alone.
+  const bool sharesValues = message.tagged.size() == message.original->size() + 1;
+  bytes += sharesValues ? message.original->size() * sizeof(Dictionary::Entry)
+                        : message.original->memorySize();
+  return bytes;
+}
+
+void logBackends(const LinkDiscovery::Backends& backends) {
+  if (backends.has_value()) {
+    kLinkLog.notice("list of backends ", platform::describe(*backends));
+  } else {
+    kLinkLog.error("no backends found, this session won't get sent to the server");
+  }
+}
+
+}  // namespace
+
+std::shared_ptr<SessionLink> SessionLink::heldBy(const Owner& owner) { return {owner, this}; }
+
+const std::shared_ptr<platform::DispatchQueue>& SessionLink::tlmReportingQueue() {
+  std::call_once(queueMade_, [this] {
+    queue_ = platform::dispatch().createSerialQueue(
+        kQueueLabel, platform::QualityOfService::kUtility, platform::QueueThreading::kShared);
+  });
+  return queue_;
+}
+
+const std::shared_ptr<platform::DispatchSemaphore>& SessionLink::tlmreportingBackendSemaphore() {
+  std::call_once(backendSemaphoreMade_,
+                 [this] { backendSemaphore_ = platform::dispatch().createSemaphore(0); });
+  return backendSemaphore_;
+}
+
+// A waiting start keeps a copy of the configuration, so it is charged like a message. Without the
+// charge a client that changed, started and stopped one session in a loop, while no server
+// answered, made the service hold 1.2 GB within ten seconds.
+void SessionLink::submitStart(const Owner& owner) {
+  LinkStart atStart{profile_.serviceType(), profile_.serviceName(), profile_.configuration()};
+  ResourceCharge charge(held_.account(), kWaitingOverhead + atStart.configuration.memorySize());
+  tlmReportingQueue()->async(JobWeight::kMayBlock,
+                             [this, owner, atStart = std::move(atStart),
+                              charge = std::move(charge)] { start(owner, atStart); });
+}
+
+void SessionLink::start(const Owner& owner, const LinkStart& atStart) {
+  kLinkLog.debug("entering tlmreporting -[HVReportingSession start]_block_invoke");
+  if (!mayUseFramework(atStart.serviceType)) return;
+  platform::TLMReportingService& framework = platform::tlmReporting();
+  const auto token = framework.TLMHierarchyTokenCreate();
+  tlmReportingAgentToken_.set(token);
+  const auto opened = framework.TLMReportingCreateSession(
+      atStart.sessionInfo(profile_.reporterID(), *token), atStart.userInfo());
+  tlmReportingSession_.set(opened);
+  // Weak: the framework may never answer. If the session is gone by then, the answer is only
+  // logged.
+  const auto discovery = std::make_shared<LinkDiscovery>(
+      [weakLink = std::weak_ptr(heldBy(owner))](const LinkDiscovery::Backends& backends) {
+        logBackends(backends);
+        if (const auto link = weakLink.lock()) link->onBackendsFound(backends.has_value());
+      });
+  framework.TLMReportingStartConfiguration(
+      opened, [discovery](const auto& backends) { discovery->answer(backends); });
+  kLinkLog.notice("waiting to find backends");
+  discovery->awaitAnswer();
+  tlmReportingQueue()->waitOn(tlmreportingBackendSemaphore(), kBackendTimeOut,
+                              [this, owner](WaitOutcome outcome) { endStart(outcome); });
+}
+
+void SessionLink::onBackendsFound(bool found) {
+  tlmReportingSessionStarted_.store(found, std::memory_order_release);
+  tlmreportingBackendSemaphore()->signal();
+}
+
+// An answer after the time-out leaves its signal in the semaphore and may leave the flag set. Both
+// are kept, and this is required: the signal ends the wait of the next start at once.
+void SessionLink::endStart(WaitOutcome outcome) {
+  if (outcome == WaitOutcome::kTimedOut) {
+    kLinkLog.notice("timed out waiting for backends");
+  } else if (tlmReportingSessionStarted()) {
+    kLinkLog.notice("continuing with backends!");
+    return;
+  } else {
+    kLinkLog.notice("failed to find backend");
+  }
+  drop();
+}
+
+void SessionLink::drop() {
+  tlmReportingSession_.set(nullptr);
+  tlmReportingAgentToken_.set(nullptr);
+}
+
+void SessionLink::submitStop(const Owner& owner) {
+  tlmReportingQueue()->async(
+      JobWeight::kMayBlock,
+      [this, owner, charge = ResourceCharge(held_.account(), kWaitingOverhead)] { stop(owner); });
+}
+
+void SessionLink::stop(const Owner& owner) {
+  kLinkLog.debug("entering tlmreporting -[HVReportingSession stop]_block_invoke");
+  if (!mayUseFramework(profile_.serviceType())) return;
+  const auto open = tlmReportingSession();
+  if (open == nullptr) {
+    endStop();
+    return;
+  }
+  // A semaphore of its own, because the link's semaphore counts discoveries. The wait has no
+  // time-out: the framework promises to end every flush.
+  const auto flushed = platform::dispatch().createSemaphore(0);
+  platform::tlmReporting().TLMReportingFlushMessages(open, [flushed] { flushed->signal(); });
+  tlmReportingQueue()->waitOn(flushed, std::nullopt,
+                              [this, owner](WaitOutcome /*outcome*/) { endStop(); });
+}
+
+void SessionLink::endStop() {
+  drop();
+  tlmReportingSessionStarted_.store(false, std::memory_order_release);
+  kLinkLog.debug("stopping and setting session to nil");
+}
+
+// A waiting message is charged to the client that sent it, not to the session's owner, who cannot
+// prevent others from sending. Messages are never dropped here to save memory: at its limit the
+// sender's next requests are refused instead, before they are answered.
+void SessionLink::submit(const Owner& owner, LinkMessage message) {
+  counters().received.add();
+  ResourceCharge charge(message.sender, message.sender == nullptr ? 0 : bytesOf(message));
+  tlmReportingQueue()->async(
+      JobWeight::kMayBlock,
+      [this, owner, message = std::move(message), charge = std::move(charge)] { handle(message); });
+}
+
+void SessionLink::handle(const LinkMessage& message) {
+  kSessionLog.debug(
+      "entering tlmreporting "
+      "-[HVReportingSession sendMessage:category:type:sync:reply:]_block_invoke");
+  if (message.wasStarted) {
+    sendThroughFramework(message);
+  } else {
+    sendAsSingleMessage(message);
+  }
+}
+
+void SessionLink::sendThroughFramework(const LinkMessage& message) {
+  const std::uint16_t category =
+      HVReportingUtilityRetrieveTLMReportingCategoryFromCategory(message.category);
+  const auto open = tlmReportingSession();
+  if (!HVReportingUtilityAllowSessionTransactions()) return counters().notAllowed.add();
+  if (profile_.serviceType() == AudioServiceType::kTest) return counters().testSession.add();
+  if (message.isRedundant) return counters().redundant.add();
+  if (open == nullptr || !tlmReportingSessionStarted()) return counters().noBackend.add();
+
+  const platform::TLMReportingOutcome outcome = platform::tlmReporting().TLMReportingSendMessage(
+      open, {.category = category, .type = number(message.type), .payload = message.tagged});
+  if (outcome.sent) {
+    counters().sent.add();
+    kSessionLog.debug("TLMReportingAgent ", *open, " : message ", message.original, " : category ",
+                      number(message.category), " : type ", number(message.type));
+    return;
+  }
+  counters().failed.add();
+  if (outcome.error.has_value()) {
+    kSessionLog.error("error sending message ", outcome.error->description);
+  }
+}
+
+// Uses the service type of this moment, not the one of the moment of sending; this is required.
+void SessionLink::sendAsSingleMessage(const LinkMessage& message) const {
+  kSessionLog.debug("session not started, will send as a single message");
+  counters().single.add();
+  submitSingleMessage({message.tagged, message.category, message.type, profile_.serviceType()},
+                      nullptr, message.sender);
+}
+
+}  // namespace halvox

@@ -1,0 +1,113 @@
+#pragma once
+
+#include <atomic>
+#include <memory>
+#include <mutex>
+#include <optional>
+
+#include "backends/HVReportingVocabulary.h"
+#include "platform/dispatch.h"
+#include "platform/tlm_reporting.h"
+#include "platform/value.h"
+#include "session/Guarded.h"
+#include "session/ResourceAccount.h"
+
+namespace halvox {
+
+class HVReportingSession;
+class SessionProfile;
+struct LinkStart;
+
+// A message on its way to the link.
+struct LinkMessage {
+  platform::Message original{};  // as the client gave it
+  platform::Dictionary tagged{};
+  AudioEventCategory category{};
+  AudioEventType type{};
+  bool wasStarted = false;  // at the moment of sending
+  bool isRedundant = false;
+  std::shared_ptr<ResourceAccount> sender{};  // charged while the message waits; null: nobody
+};
+
+// The real-time link of one session: its framework session, from the discovery of back-ends to the
+// last flush.
+//
+//   idle --start job--> configuring --back-ends found--> open --stop job: flush--> idle
+//                            |
+//                            '--none found, or no answer within 9 seconds--> idle
+//
+// Started messages reach the framework only while the link is open; otherwise they are dropped and
+// counted. Messages of a session that is not started become single messages. Test sessions never
+// reach the framework. Failures are logged and counted, never returned, and nothing is retried.
+//
+// Owned by the session. All work with the framework runs on the link's own serial queue, in the
+// order of submission, so messages sent during the discovery wait for its outcome and the flush
+// comes after all messages. The submitting operations return at once; they and the readers may be
+// called from any thread. Each submitted job holds the session that is passed as `owner`.
+class SessionLink {
+ public:
+  using Owner = std::shared_ptr<const HVReportingSession>;
+
+  // Reads `profile` in its jobs and charges waiting starts and stops to the account of `held`; both
+  // must outlive the link.
+  SessionLink(const SessionProfile& profile, const ResourceTally& held)
+      : profile_(profile), held_(held) {}
+  SessionLink(const SessionLink&) = delete;
+  SessionLink& operator=(const SessionLink&) = delete;
+  ~SessionLink() = default;
+
+  // Opens the link with the session's current type and configuration.
+  void submitStart(const Owner& owner);
+  void submit(const Owner& owner, LinkMessage message);
+  // Flushes what the framework still holds and closes the link.
+  void submitStop(const Owner& owner);
+
+  // Both are created on the first call: most sessions of a busy service have no link.
+  [[nodiscard]] const std::shared_ptr<platform::DispatchQueue>& tlmReportingQueue();
+  // Receives one signal for each answer of the framework about back-ends.
+  [[nodiscard]] const std::shared_ptr<platform::DispatchSemaphore>& tlmreportingBackendSemaphore();
+  // The framework's session and its token; null unless the link is configuring or open.
+  [[nodiscard]] platform::TLMReportingService::Session tlmReportingSession() const {
+    return tlmReportingSession_.copy();
+  }
+  [[nodiscard]] platform::TLMReportingService::Token tlmReportingAgentToken() const {
+    return tlmReportingAgentToken_.copy();
+  }
+  // Whether the framework found back-ends. An answer after the time-out sets it too, although there
+  // is no framework session then.
+  [[nodiscard]] bool tlmReportingSessionStarted() const {
+    return tlmReportingSessionStarted_.load(std::memory_order_acquire);
+  }
+  // The flag itself, for callers that watch it; lives as long as the link.
+  [[nodiscard]] const std::atomic<bool>* getTLMReportingStartedState() const {
+    return &tlmReportingSessionStarted_;
+  }
+
+ private:
+  // This link, kept alive by its session.
+  [[nodiscard]] std::shared_ptr<SessionLink> heldBy(const Owner& owner);
+  // Except for onBackendsFound(), these run on the link's queue.
+  void start(const Owner& owner, const LinkStart& atStart);
+  void endStart(platform::WaitOutcome outcome);
+  void stop(const Owner& owner);
+  void endStop();
+  void drop();
+  void handle(const LinkMessage& message);
+  void sendThroughFramework(const LinkMessage& message);
+  void sendAsSingleMessage(const LinkMessage& message) const;
+  // Runs on the framework's thread or on the discovery's queue.
+  void onBackendsFound(bool found);
+
+  const SessionProfile& profile_;  // the session's
+  const ResourceTally& held_;      // the session's
+  std::once_flag queueMade_;
+  std::shared_ptr<platform::DispatchQueue> queue_;
+  std::once_flag backendSemaphoreMade_;
+  std::shared_ptr<platform::DispatchSemaphore> backendSemaphore_;
+  Guarded<platform::TLMReportingService::Session> tlmReportingSession_;
+  Guarded<platform::TLMReportingService::Token> tlmReportingAgentToken_;
+  // The framework's thread sets it before it signals the semaphore; orders nothing else.
+  std::atomic<bool> tlmReportingSessionStarted_{false};
+};
+
+}  // namespace halvox

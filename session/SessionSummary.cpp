@@ -1,0 +1,81 @@
+#include "session/SessionSummary.h"
+
+#include <cstdint>
+#include <string_view>
+
+#include "backends/HVReportingUtility.h"
+#include "platform/clock.h"
+#include "platform/files.h"
+#include "platform/services.h"
+#include "session/SessionLog.h"
+#include "session/SessionProfile.h"
+#include "session/SummaryEvent.h"
+#include "session/SummaryFileName.h"
+#include "session/VolumeMessages.h"
+
+namespace halvox {
+namespace {
+
+using platform::Message;
+
+constexpr std::string_view kDirectory =
+    "/private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
+constexpr std::uint32_t kDirectoryPermissions = 0777;
+
+}  // namespace
+
+void SessionSummary::sendVolumeMessages(const Send& send) const {
+  VolumeWalk walk(HVReportingUtilityVolumeMinimumPlayingTime(profile_.serviceType()),
+                  history_.size());
+  const auto next = [&walk, this]() -> Message {
+    const SessionHistory::Lock history = history_.lock();
+    return history->has_value() ? walk.next(**history) : std::nullopt;
+  };
+  Message message = next();
+  if (!message.has_value()) return;
+  kSessionLog.notice("sending volume event for reporter ", number(profile_.reporterID()));
+  for (; message.has_value(); message = next()) send(message);
+}
+
+Message SessionSummary::createEvent() const {
+  const SessionHistory::Lock history = history_.lock();
+  if (!history->has_value() || (*history)->empty()) return std::nullopt;
+  SummaryEvent event(profile_.serviceType());
+  for (const MessageHistory::Entry& entry : **history) event.add(entry.message());
+  return event.take();
+}
+
+// Writes the text piece by piece, because a long history and its whole text may not fit into memory
+// together. So the directory is created before the text is made. Every value has a JSON text, so
+// only the file can fail.
+void SessionSummary::writeFile() const {
+  if (!HVReportingUtilityIsInternalBuild() || history_.size() == 0) return;
+  platform::FileService& files = platform::files();
+  if (const auto error = files.createDirectory(kDirectory, kDirectoryPermissions)) {
+    kSessionLog.error("can't create logging directory at ", kDirectory, ": ", error->description);
+  }
+  const auto file = files.createJsonArrayFile(kDirectory, fileName());
+  {
+    const SessionHistory::Lock history = history_.lock();
+    if (!history->has_value()) return;
+    for (const MessageHistory::Entry& entry : **history) {
+      file->appendObject(entry.identifier(), entry.message());
+    }
+  }
+  std::string path;
+  if (const auto error = file->commit(path)) {
+    kSessionLog.error("jsonOutput writeToURL: ", error->description);
+  } else {
+    kSessionLog.info("jsonOutput writeToURL: ", path);
+  }
+}
+
+std::string SessionSummary::fileName() const {
+  const platform::ClockService& clock = platform::clock();
+  return makeSummaryFileName(
+      {.time = clock.localTime(clock.currentDate()),
+       .appName = platform::describe(HVReportingUtilityRetrieveAppName(profile_.configuration())),
+       .serviceName = profile_.serviceName()});
+}
+
+}  // namespace halvox
