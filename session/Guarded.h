@@ -5,12 +5,12 @@
 
 namespace halvox {
 
-// A value that can be reached only while its lock is held, so no reader sees it half written.
-// The lock is short and not recursive: nothing that waits belongs under it.
+// A value that can be reached only while its lock is held. Any thread may call. The lock is not
+// recursive; hold it briefly, and never while waiting, logging or calling back.
 template <typename T>
 class Guarded {
  public:
-  // The value, locked as long as this object lives.
+  // The value, locked for as long as this object lives.
   class Lock {
    public:
     T& operator*() const { return value_; }
@@ -27,14 +27,14 @@ class Guarded {
   explicit Guarded(T value) : value_(std::move(value)) {}
 
   [[nodiscard]] Lock lock() const { return Lock(*this); }
-  // A copy of the value as it is now.
+  // Returns a copy of the value.
   [[nodiscard]] T copy() const { return *lock(); }
-  // Replaces the value. The old one is destroyed after the lock was released.
+  // Replaces the value. The old value is destroyed after the lock has been released.
   void set(T value) {
     Lock locked(*this);
     std::swap(*locked, value);
   }
-  // Takes the value out and leaves an empty one.
+  // Returns the value and leaves an empty one.
   [[nodiscard]] T take() {
     T taken{};
     Lock locked(*this);

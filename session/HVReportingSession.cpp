@@ -21,7 +21,8 @@ using platform::Message;
 constexpr AudioEventCategory kSummaryCategory{0xFFFFFFFF};
 constexpr AudioEventType kSummaryType = AudioEventType::kUnknown;
 
-// Replies to starts that will never be sent, because the session went without having been stopped.
+// Counts the replies to starts that are never sent, because the session is destroyed before it has
+// been stopped.
 platform::Counter& startRepliesDropped() {
   static platform::Counter& counter =
       platform::statistics().counter("start replies", "dropped: session released");

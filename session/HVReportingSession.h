@@ -28,7 +28,7 @@ inline constexpr std::string_view kHVReportingSessionThrottleSecondsKey = "_thro
 // and passes them on to the real-time link.
 //
 //   created --start--> started --stop--> stopped --start--> started
-//   any state --last reference released--> gone; nothing is stopped or flushed
+//   any state --last reference released--> destroyed, without being stopped
 //
 // The client's connection object owns it and drives it on the reporting queue. Jobs and analytics
 // payloads that need the session share it, so it is always held by a shared pointer. The properties
@@ -47,7 +47,7 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   HVReportingSession& operator=(const HVReportingSession&) = delete;
   ~HVReportingSession();
 
-  // Charges what the session holds to `account` until the session is gone. Call at most once,
+  // Charges what the session holds to `account` until the session is destroyed. Call at most once,
   // before any other operation.
   void chargeTo(Account account) { held_.chargeTo(std::move(account)); }
 
@@ -66,8 +66,8 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   // The configuration at this moment, empty if none was set. Later changes do not alter the
   // returned dictionary.
   [[nodiscard]] platform::Dictionary configuration() const { return profile_.configuration(); }
-  // Both add the entries of a dictionary; a new value replaces the old one. None changes nothing.
-  // No key is ever removed.
+  // Both add the entries of a dictionary. A new value replaces the old one, and no key is ever
+  // removed. None changes nothing.
   void setConfiguration(const platform::Message& configuration);
   void updateConfigurationWithContentsOfConfiguration(const platform::Dictionary& configuration) {
     profile_.mergeConfiguration(configuration);
@@ -92,8 +92,8 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   void setDriverSnapShot(std::optional<DriverSnapShot> snapShot) {
     driverSnapShot_.set(std::move(snapShot));
   }
-  // A reply that the client connection sends when the session has been stopped. The session only
-  // keeps it and never calls it; a reply that is still here when the session goes is counted.
+  // The reply that the client connection calls when the session has been stopped. The session only
+  // keeps it. A reply that is still here when the session is destroyed is counted as dropped.
   [[nodiscard]] BoolReply transactionCompleteBlock() const {
     return transactionCompleteBlock_.copy();
   }
@@ -107,11 +107,12 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   // "reporterID=7,serviceName=haptics,ownerPid=12,HostApplicationDisplayID=Unknown,started=0"
   [[nodiscard]] std::string description() const;
   void appendDescription(std::string& text) const;
+  // Nothing calls this; it is part of the session's interface.
   [[nodiscard]] bool shouldReportOrientation() const { return false; }
 
   // Begins a run with an empty history, begins to open the link if it is enabled, and traces the
-  // run if the session is a test. Does nothing to a started session. Waits for nothing but, if the
-  // service's own traces are chosen, the disk.
+  // run of a test session. Does nothing to a started session. Does not wait for the link, but reads
+  // the trace parameters file if there is one.
   void start();
   // Reports the run (volume messages, the summary file, the summary event), closes the link after
   // those messages, ends the trace, and forgets the history. Does nothing unless the session is
@@ -173,8 +174,8 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   Guarded<BoolReply> transactionCompleteBlock_;
   Guarded<std::optional<DriverSnapShot>> driverSnapShot_;
   std::atomic<bool> tlmReportingEnabled_{false};  // orders nothing else
-  // Set before the history is made and cleared after it is gone. A reader that sees it set may
-  // still find no history, and then records nothing.
+  // Set before the history exists and cleared after it has been taken. A thread that sees it set
+  // may still find no history, and then records nothing.
   std::atomic<bool> started_{false};
 };
 

@@ -174,7 +174,7 @@ TEST_F(HVReportingSessionSendingTest, TimeDoesNotEndARepetition) {
   EXPECT_THAT(identifiers(), ElementsAre("Playback_Start_1"));
 }
 
-TEST_F(HVReportingSessionSendingTest, NothingIsHeldBackOrLeftOutForTheKeysThatNobodyReads) {
+TEST_F(HVReportingSessionSendingTest, KeysThatNobodyReadNeitherThrottleNorExclude) {
   const platform::Key blacklist(kHVReportingSessionBlacklistFieldsKey);
   const platform::Key throttle(kHVReportingSessionThrottleSecondsKey);
   send({{"a", 1}, {blacklist, platform::Array{"a"}}, {throttle, 3600}});
@@ -192,7 +192,7 @@ TEST_F(HVReportingSessionSendingTest, ReplyIsCalledOnceWithNoneBeforeTheCallRetu
   EXPECT_THAT(replies, ElementsAre(std::nullopt));
 }
 
-TEST_F(HVReportingSessionSendingTest, CreatingAnIdentifierTellsWhetherTheMessageWasDropped) {
+TEST_F(HVReportingSessionSendingTest, CreatingAnIdentifierReturnsWhetherTheMessageWasDropped) {
   const auto history = session_->nestedAggregatedPayloadData();
   const Dictionary message{{"a", 1}};
 
@@ -209,7 +209,7 @@ TEST_F(HVReportingSessionSendingTest, WithoutAHistoryNothingIsRecordedAndNothing
   EXPECT_FALSE(history->has_value());
 }
 
-// The summary event of the stop is a message like others.
+// The summary event of the stop is counted like any other message.
 TEST_F(HVReportingSessionSendingTest, CountsOfMessagesBalance) {
   send({{"a", 1}});
   send({{"a", 1}});
@@ -230,7 +230,7 @@ TEST_F(HVReportingSessionSendingTest, ASessionWithoutTheLinkSubmitsNothing) {
   EXPECT_THAT(platform_.dispatch.createdQueues(), IsEmpty());
 }
 
-TEST_F(HVReportingSessionSendingTest, BeforeTheStartAMessageGoesOutAsASingleOneASecondLater) {
+TEST_F(HVReportingSessionSendingTest, BeforeTheStartAMessageIsSentAsASingleOneASecondLater) {
   session_->stop();
   session_->setTlmReportingEnabled(true);
   session_->setServiceType(AudioServiceType::kHaptics);

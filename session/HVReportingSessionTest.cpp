@@ -301,7 +301,7 @@ TEST_F(HVReportingSessionTest, ATransactionCompleteBlockIsTakenOnceAndNeverCalle
   EXPECT_FALSE(session->transactionCompleteBlock());
 }
 
-TEST_F(HVReportingSessionTest, AReplyThatGoesWithItsSessionIsCounted) {
+TEST_F(HVReportingSessionTest, AReplyDestroyedWithItsSessionIsCounted) {
   auto session = makeSession();
   session->setTransactionCompleteBlock([](const auto&, bool) {});
 
@@ -354,8 +354,8 @@ TEST_F(HVReportingSessionTest, StopGivesTheHistoryBackAndDestructionTheRest) {
   EXPECT_EQ(account->use().bytes, 0U);
 }
 
-// Codes without a text of their own share the base of "Undefined", and a repetition under a second
-// such code records nothing but the code.
+// Categories without a text share the base "Undefined". A repetition under a second such category
+// records only the new code.
 TEST_F(HVReportingSessionTest, RepetitionsUnderAnotherCodeOfTheSameTextAreChargedToo) {
   const auto account = std::make_shared<ResourceAccount>();
   const auto session = makeSession();
@@ -372,7 +372,7 @@ TEST_F(HVReportingSessionTest, RepetitionsUnderAnotherCodeOfTheSameTextAreCharge
   EXPECT_EQ(account->use().bytes, 0U);
 }
 
-// Whoever holds the history holds up a start only when the session is marked as started.
+// A thread that holds the history blocks a start only after the session is marked as started.
 TEST_F(HVReportingSessionTest, StartSetsTheFlagBeforeItMakesTheHistory) {
   const auto session = makeSession();
   std::jthread starter;
@@ -390,7 +390,7 @@ TEST_F(HVReportingSessionTest, StartSetsTheFlagBeforeItMakesTheHistory) {
   EXPECT_TRUE(session->nestedAggregatedPayloadData()->has_value());
 }
 
-// Runs under ThreadSanitizer: payloads are built from sessions on other threads.
+// For ThreadSanitizer: other threads build payloads from sessions.
 TEST_F(HVReportingSessionTest, PropertiesMayBeReadWhileTheyAreWritten) {
   const auto session = makeSession();
   platform_.log.setLevel(LogLevel::kError);

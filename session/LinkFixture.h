@@ -11,7 +11,7 @@
 #include "platform/fake/FakePlatform.h"
 #include "session/HVReportingSession.h"
 
-// What the tests of the real-time link share.
+// Shared by the tests of the real-time link.
 namespace halvox::link_test {
 
 using platform::Array;
@@ -41,7 +41,7 @@ inline const std::string kMessageEntered =
     "entering tlmreporting "
     "-[HVReportingSession sendMessage:category:type:sync:reply:]_block_invoke";
 
-// A session with the link enabled that is not started yet. What is submitted runs when told, or
+// A session with the link enabled, not started yet. Submitted jobs run when a test calls run(), and
 // before start(), stop() and open() return.
 class LinkFixture : public testing::Test {
  protected:
@@ -59,7 +59,7 @@ class LinkFixture : public testing::Test {
     session_->stop();
     run();
   }
-  // From now on discoveries wait for the test.
+  // From now on a discovery waits until the test answers it.
   void holdDiscoveries() { framework_.answerDiscoveries(Fake::Answering::kWhenTold); }
   void open() {
     framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
@@ -69,7 +69,7 @@ class LinkFixture : public testing::Test {
             AudioEventType type = kStart) {
     session_->sendMessage(message, category, type, nullptr);
   }
-  // What the session logged of its link since the last call, apart from messages.
+  // The lines of the link's log since the last call.
   std::vector<Line> linkLines() {
     std::vector<Line> result;
     for (const auto& line : platform_.log.lines()) {
@@ -86,7 +86,7 @@ class LinkFixture : public testing::Test {
     for (const auto& message : framework_.messages()) result.push_back(message.payload);
     return result;
   }
-  // Whether the link is down and forgotten.
+  // True if the link is closed and released.
   bool holdsNothing() const {
     return session_->link().tlmReportingSession() == nullptr &&
            session_->link().tlmReportingAgentToken() == nullptr;

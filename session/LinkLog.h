@@ -5,8 +5,7 @@
 
 namespace halvox {
 
-// What the session logs with about its real-time link. Messages on their way through the link are
-// the session's own affair and go to its other log.
+// The log of the link's own events. Lines about the messages that it sends go to the session's log.
 inline constexpr platform::UnitLog kLinkLog(&HVReportingSessionTLMReportingCategory,
                                             "HVReportingSession");
 

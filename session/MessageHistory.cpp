@@ -11,10 +11,10 @@ namespace {
 using platform::Dictionary;
 using platform::Key;
 
-// A client can name more categories and types than there are texts for them: what does not fit here
-// is found by its text. No honest client comes near.
+// Bounds the table of codes, because a client can invent any number of categories and types. A base
+// whose code is not in the table is found by its text. No honest client needs so many codes.
 constexpr std::size_t kMaxBasesByCode = 4096;
-// A hash table's node and bucket, about.
+// Estimated bytes of a node and a bucket of a hash table.
 constexpr std::size_t kTableEntryOverhead = 48;
 
 const Key kProcessUptimeKey("processuptime_ms");
@@ -91,7 +91,8 @@ void MessageHistory::append(Base& base, Dictionary message) {
 
 bool equalApartFromVolatileKeys(const Dictionary& left, const Dictionary& right) {
   if (left.isIdenticalTo(right)) return true;
-  // Repeated messages nearly always have the same keys in the same order.
+  // Repeated messages nearly always have the same keys in the same order: this loop needs no
+  // look-up.
   if (left.size() == right.size()) {
     const Dictionary::Entry* other = right.begin();
     const Dictionary::Entry* entry = left.begin();

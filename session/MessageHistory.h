@@ -14,27 +14,27 @@ namespace halvox {
 
 // The messages that a session accepted in its current run, in order of acceptance.
 //
-// Every message has an identifier, "base_n": the base names the category and the type, n counts the
-// accepted messages of that base from 1 on. Bases are kept once and identifiers are put together
-// only when somebody asks, so an entry costs 24 bytes beside its message.
+// Each message has an identifier "base_n": the base names the category and the type, and n counts
+// the accepted messages of that base from 1. A base is stored once and an identifier is built only
+// when it is needed, so an entry takes 24 bytes in addition to its message.
 //
-// The newest entry of a base is found without a walk: the time that a message takes does not grow
-// with the history. Belongs to its session, which guards it.
+// The newest entry of a base is found without a walk, so the time for a message does not grow with
+// the history. Owned by the session's SessionHistory, whose lock guards it.
 class MessageHistory {
  public:
-  // The texts of a category and a type, and where the newest message with them is.
+  // The name of a category and type, and where their newest message is.
   class Base {
    public:
     explicit Base(std::string text) : text_(std::move(text)) {}
     [[nodiscard]] const std::string& text() const { return text_; }
-    // Number of accepted messages.
+    // The number of accepted messages.
     [[nodiscard]] std::uint64_t count() const { return count_; }
 
    private:
     friend class MessageHistory;
     std::string text_;
     std::uint64_t count_ = 0;
-    std::size_t newest_ = 0;  // position in the history of base_count; only when count_ > 0
+    std::size_t newest_ = 0;  // position of the newest message; only if count_ > 0
   };
 
   // One accepted message.
@@ -66,32 +66,32 @@ class MessageHistory {
   [[nodiscard]] Iterator end() const { return entries_.end(); }
   [[nodiscard]] const Entry& operator[](std::size_t position) const { return entries_[position]; }
 
-  // Number of accepted messages of the base with that text.
+  // The number of accepted messages of the base with this text.
   [[nodiscard]] std::uint64_t count(const std::string& base) const;
 
-  // The base of that category and type; made with a count of 0 at first sight. Valid as long as the
-  // history, also when the history is moved.
+  // The base of a category and type; creates it if needed. Valid as long as the history, even if
+  // the history is moved.
   Base& base(AudioEventCategory category, AudioEventType type);
-  // The newest message of a base, or null when there is none. Valid until the next append.
+  // The newest message of a base, or null if there is none. Valid until the next append().
   [[nodiscard]] const platform::Dictionary* newestMessage(const Base& base) const;
   // Adds a message under the next identifier of the base.
   void append(Base& base, platform::Dictionary message);
 
-  // Bytes that the history keeps alive. Constant time.
+  // The bytes that the history keeps alive. Constant time.
   [[nodiscard]] std::size_t memorySize() const { return memorySize_; }
 
  private:
   Base& baseWithText(std::string text);
 
   std::unordered_map<std::string, Base> bases_;
-  std::unordered_map<std::uint64_t, Base*> basesByCode_;  // saves making the text for each message
+  std::unordered_map<std::uint64_t, Base*> basesByCode_;  // saves building a text for each message
   std::deque<Entry> entries_;
   std::size_t memorySize_ = 0;
 };
 
-// True when the two messages have the same entries, whatever they have under the keys that the
-// service stamps into every message: "processuptime_ms", "systemuptime_sec" and
-// "hvreporting_timestamp". Copies neither.
+// True if the messages have the same entries in any order, apart from the keys that the service
+// stamps into each message: "processuptime_ms", "systemuptime_sec" and "hvreporting_timestamp".
+// Copies neither message.
 [[nodiscard]] bool equalApartFromVolatileKeys(const platform::Dictionary& left,
                                               const platform::Dictionary& right);
 

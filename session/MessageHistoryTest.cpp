@@ -69,7 +69,7 @@ TEST_F(MessageHistoryTest, KeepsTheOrderOfAcceptance) {
   EXPECT_EQ(order, "{a = 1}{a = 2}{a = 3}");
 }
 
-TEST_F(MessageHistoryTest, FindsTheNewestMessageOfABaseBehindThoseOfOthers) {
+TEST_F(MessageHistoryTest, FindsTheNewestMessageOfABaseAmongThoseOfOthers) {
   append(kPlayback, kStart, {{"a", 1}});
   append(kPlayback, kStart, {{"a", 2}});
   append(kPlayback, kState, {{"a", 3}});
@@ -100,7 +100,7 @@ TEST_F(MessageHistoryTest, CodesBeyondTheBoundStillFindTheirBase) {
     append(AudioEventCategory{0x0001'0000U * (code + 1) + 4}, kStart, {{"a", code}});
   }
 
-  // Four of them are a domain that has a text; all others share one base.
+  // Four of them are domains with a text. All others share one base.
   EXPECT_EQ(history_.count("_Playback_Start"), kManyCodes - 4);
   EXPECT_EQ(history_.count("Session_Playback_Start"), 1U);
 }
@@ -121,8 +121,8 @@ TEST_F(MessageHistoryTest, AMessageOfTenFieldsCostsAtMostFiveHundredBytes) {
   EXPECT_GE(history_.memorySize() - before, 14 * sizeof(Dictionary::Entry));
 }
 
-// A client can name many categories that share the text of none.
-TEST_F(MessageHistoryTest, EachCodeAndEachBaseIsPaidForWithAboutANodeOfATable) {
+// A client can invent many categories, which all share one text.
+TEST_F(MessageHistoryTest, EachCodeAndEachBaseCostsAboutANodeOfATable) {
   constexpr std::uint32_t kCodes = 100;
   constexpr std::size_t kNode = 48;
   const std::string text = "Undefined_Start";
@@ -136,7 +136,7 @@ TEST_F(MessageHistoryTest, EachCodeAndEachBaseIsPaidForWithAboutANodeOfATable) {
   EXPECT_GE(ofCodes, kCodes * (kNode + 2 * sizeof(void*)));
   EXPECT_LE(ofCodes, kCodes * 2 * kNode);
 
-  history_.base(category(17), kStart);  // known
+  history_.base(category(17), kStart);  // already known
   EXPECT_EQ(history_.memorySize() - first, ofCodes);
 }
 

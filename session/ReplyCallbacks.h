@@ -7,8 +7,8 @@
 
 namespace halvox {
 
-// The callbacks with which requests are answered: the error first, or none. An empty one means that
-// nobody wants an answer, where an operation says that it may be empty.
+// The callbacks that answer requests. The error comes first; none means success. A callback may be
+// empty only where an operation says so: nobody wants the answer then.
 using ErrorReply = std::function<void(const std::optional<platform::Error>& error)>;
 using BoolReply = std::function<void(const std::optional<platform::Error>& error, bool value)>;
 

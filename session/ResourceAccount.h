@@ -60,9 +60,10 @@ class ResourceCharge {
   std::size_t bytes_ = 0;
 };
 
-// Charges to an account what one owner holds, while the amount changes. The destructor gives back
-// whatever is still charged. Without an account it charges nobody.
-// Belongs to one session; its parts report their changes to it from any thread.
+// Charges to an account what one session holds, as the amount changes. The destructor gives back
+// what is still charged. Without an account it charges nobody.
+//
+// Owned by the session, whose parts report their changes to it from any thread.
 class ResourceTally {
  public:
   ResourceTally() = default;
@@ -79,7 +80,8 @@ class ResourceTally {
   // Something that took `before` bytes takes `after` bytes now.
   void change(std::size_t before, std::size_t after) {
     if (account_ == nullptr) return;
-    const std::size_t difference = after - before;  // wraps, and so subtracts, when less is held
+    // Unsigned: if less is held now, the difference wraps and adding it subtracts.
+    const std::size_t difference = after - before;
     account_->addBytes(difference);
     bytes_.fetch_add(difference, std::memory_order_relaxed);
   }

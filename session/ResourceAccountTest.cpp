@@ -8,7 +8,7 @@
 namespace halvox {
 namespace {
 
-TEST(ResourceChargeTest, IsPaidForAsLongAsItOrACopyLives) {
+TEST(ResourceChargeTest, IsChargedAsLongAsItOrACopyLives) {
   const auto account = std::make_shared<ResourceAccount>();
   {
     ResourceCharge charge(account, 100);

@@ -181,9 +181,9 @@ void SessionLink::endStop() {
   kLinkLog.debug("stopping and setting session to nil");
 }
 
-// A waiting message is charged to the client that sent it, not to the session's owner, who cannot
-// prevent others from sending. Messages are never dropped here to save memory: at its limit the
-// sender's next requests are refused instead, before they are answered.
+// A waiting message is charged to the client that sent it, because the owner of the session cannot
+// prevent other clients from sending. Nothing is dropped here to save memory. Instead, the sender's
+// next requests are refused while its account is over the limit, before they are answered.
 void SessionLink::submit(const Owner& owner, LinkMessage message) {
   counters().received.add();
   ResourceCharge charge(message.sender, message.sender == nullptr ? 0 : bytesOf(message));

@@ -36,14 +36,14 @@ struct LinkMessage {
 //                            |
 //                            '--none found, or no answer within 9 seconds--> idle
 //
-// Started messages reach the framework only while the link is open; otherwise they are dropped and
-// counted. Messages of a session that is not started become single messages. Test sessions never
-// reach the framework. Failures are logged and counted, never returned, and nothing is retried.
+// Messages that were sent during a run reach the framework only while the link is open; otherwise
+// they are dropped and counted. Messages that were sent outside a run become single messages. Test
+// sessions never reach the framework. Failures are logged and counted, and nothing is retried.
 //
 // Owned by the session. All work with the framework runs on the link's own serial queue, in the
-// order of submission, so messages sent during the discovery wait for its outcome and the flush
-// comes after all messages. The submitting operations return at once; they and the readers may be
-// called from any thread. Each submitted job holds the session that is passed as `owner`.
+// order of submission: messages wait until the discovery has ended, and the flush comes after all
+// messages. Any thread may call. The submitting operations return at once; each job holds `owner`,
+// the session.
 class SessionLink {
  public:
   using Owner = std::shared_ptr<const HVReportingSession>;
@@ -78,7 +78,7 @@ class SessionLink {
   [[nodiscard]] bool tlmReportingSessionStarted() const {
     return tlmReportingSessionStarted_.load(std::memory_order_acquire);
   }
-  // The flag itself, for callers that watch it; lives as long as the link.
+  // The flag itself, for callers that watch it; lives as long as the link. Only tests do.
   [[nodiscard]] const std::atomic<bool>* getTLMReportingStartedState() const {
     return &tlmReportingSessionStarted_;
   }

@@ -7,7 +7,7 @@
 
 #include "session/LinkFixture.h"
 
-// Who pays for messages that wait to go out over the link.
+// Which client is charged for messages that wait for the link.
 namespace halvox::link_test {
 namespace {
 
@@ -38,7 +38,7 @@ TEST_F(SessionLinkChargesTest, ASingleMessageOfAnotherClientIsChargedToThatOne) 
   EXPECT_EQ(framework_.singleMessages().size(), 1U);
 }
 
-TEST_F(SessionLinkChargesTest, OwnersPayForTheHistoryAndSendersForWhatWaits) {
+TEST_F(SessionLinkChargesTest, OwnersAreChargedForTheHistoryAndSendersForWhatWaits) {
   holdDiscoveries();
   start();
 
@@ -58,7 +58,7 @@ TEST_F(SessionLinkChargesTest, MessagesOfTheSessionItselfAreChargedToItsOwner) {
   start();
   send({{"a", 1}});
 
-  session_->stop();  // its summary and its end wait now, and the history is gone
+  session_->stop();  // the summary and the stop job wait now; the history is gone
   EXPECT_GT(owner_->use().bytes, 0U);
   framework_.answerDiscovery(kServers);
   run();

@@ -134,9 +134,10 @@ TEST_F(SessionLinkMessagesTest, ASessionThatBecameATestSendsNoMore) {
   EXPECT_THAT(framework_.messages(), IsEmpty());
 }
 
-// The counts say why a message was not sent: of several reasons the first of this order.
+// The counters give the reason why a message was not sent; of several reasons, the first in this
+// order.
 TEST_F(SessionLinkMessagesTest, ARepeatCountsAsOneThoughTheLinkIsDown) {
-  start();  // no server is found
+  start();  // finds no server
 
   send({{"a", 1}});
   send({{"a", 1}});
@@ -184,7 +185,7 @@ TEST_F(SessionLinkMessagesTest, BeforeTheStartAMessageIsASingleOne) {
   EXPECT_EQ(*info.find("TLMReportingSessionInfoClientType"), platform::Value(19));
 }
 
-// Whether it was started counts when it is sent, not when its job runs.
+// The state at the moment of sending decides, not the state when the job runs.
 TEST_F(SessionLinkMessagesTest, AMessageOfAStartedSessionIsNoSingleOneThoughTheStopOvertakes) {
   framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
   session_->start();
@@ -193,7 +194,7 @@ TEST_F(SessionLinkMessagesTest, AMessageOfAStartedSessionIsNoSingleOneThoughTheS
 
   run();
 
-  EXPECT_EQ(framework_.messages().size(), 2U);  // and the summary event
+  EXPECT_EQ(framework_.messages().size(), 2U);  // one is the summary event
   EXPECT_THAT(framework_.singleMessages(), IsEmpty());
   EXPECT_EQ(platform_.dispatch.delayedJobs(), 0U);
 }
@@ -294,7 +295,7 @@ TEST_F(SessionLinkMessagesTest, WhatWaitsStaysChargedWhenTheSessionIsStopped) {
 
 // --- stop ---------------------------------------------------------------------------------------
 
-TEST_F(SessionLinkMessagesTest, StopFlushesBehindAllMessages) {
+TEST_F(SessionLinkMessagesTest, StopFlushesAfterAllMessages) {
   open();
   send({{"a", 1}});
   platform_.journal.clear();
@@ -354,11 +355,11 @@ TEST_F(SessionLinkMessagesTest, AFlushTakesNoSignalOfADiscovery) {
   holdDiscoveries();
   start();
   platform_.dispatch.advance(9s);
-  framework_.answerDiscovery(kServers);  // too late: the signal stays
+  framework_.answerDiscovery(kServers);  // too late: the signal remains
   stop();
   framework_.answerFlushes(Fake::Answering::kWhenTold);
   holdDiscoveries();
-  start();  // takes the signal and gives up
+  start();  // consumes the signal and gives up
   stop();   // has nothing to flush
   framework_.answerDiscovery(kServers);
 
@@ -378,7 +379,7 @@ TEST_F(SessionLinkMessagesTest, StopWithoutAFrameworkSessionFlushesNothing) {
   EXPECT_THAT(linkLines(), ElementsAre(kStopEntered, kClosed));
 }
 
-TEST_F(SessionLinkMessagesTest, StopDuringTheWaitClosesBehindIt) {
+TEST_F(SessionLinkMessagesTest, StopDuringTheWaitClosesTheLinkAfterIt) {
   holdDiscoveries();
   start();
   session_->stop();
@@ -434,7 +435,7 @@ TEST_F(SessionLinkMessagesTest, TheLastJobKeepsTheSessionUntilItIsFlushed) {
   EXPECT_TRUE(session.expired());
 }
 
-// Runs under ThreadSanitizer: discovery answers on a thread of the framework.
+// For ThreadSanitizer: the discovery answers on a thread of the framework.
 TEST_F(SessionLinkMessagesTest, DiscoveryMayAnswerOnAnotherThread) {
   holdDiscoveries();
   start();

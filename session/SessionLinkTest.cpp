@@ -64,7 +64,7 @@ TEST_F(SessionLinkTest, LinesGoToTheLinksCategoryUnderTheSessionsName) {
   EXPECT_EQ(line.line.substr(0, 26), "       HVReportingSession:");
 }
 
-TEST_F(SessionLinkTest, TheSessionInfoTellsWhatTheLinkIs) {
+TEST_F(SessionLinkTest, TheSessionInfoDescribesTheLink) {
   open();
 
   EXPECT_EQ(framework_.sessions().at(0).sessionInfo,
@@ -136,7 +136,7 @@ TEST_F(SessionLinkTest, ATestSessionNeverReachesTheFramework) {
 
   EXPECT_THAT(frameworkSteps(), IsEmpty());
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kStopEntered));
-  EXPECT_EQ(platform_.statistics.value("link", "dropped: test session"), 2U);  // and the summary
+  EXPECT_EQ(platform_.statistics.value("link", "dropped: test session"), 2U);  // one is the summary
 }
 
 TEST_F(SessionLinkTest, BackendsThatAreFoundOpenTheLink) {
@@ -161,7 +161,7 @@ TEST_F(SessionLinkTest, BackendsAreListedAfterTheWaitForThem) {
   EXPECT_TRUE(session_->link().tlmReportingSessionStarted());
 }
 
-// The framework's thread may be faster than the job that asked it.
+// The framework's thread may answer before the start job waits.
 TEST_F(SessionLinkTest, BackendsFoundBeforeTheDiscoveryReturnsAreListedAfterTheWaitToo) {
   framework_.answerDiscoveries(Fake::Answering::kBeforeReturning, kServers);
 
@@ -171,7 +171,7 @@ TEST_F(SessionLinkTest, BackendsFoundBeforeTheDiscoveryReturnsAreListedAfterTheW
   EXPECT_TRUE(session_->link().tlmReportingSessionStarted());
 }
 
-TEST_F(SessionLinkTest, NoBackendsBeforeTheDiscoveryReturnsAreToldAfterTheWaitToo) {
+TEST_F(SessionLinkTest, NoBackendsBeforeTheDiscoveryReturnsIsLoggedAfterTheWaitToo) {
   framework_.answerDiscoveries(Fake::Answering::kBeforeReturning);
 
   start();
@@ -241,7 +241,7 @@ TEST_F(SessionLinkTest, ASignalThatCameTooLateFailsTheNextStartAtOnce) {
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kFailed));
   EXPECT_TRUE(holdsNothing());
 
-  // The second callback signals into the void again, for the third start to find.
+  // Nobody waits for the second callback either: its signal remains for the third start.
   framework_.answerDiscovery(kServers);
   stop();
   linkLines();
@@ -286,7 +286,7 @@ TEST_F(SessionLinkTest, ACallbackThatNeverComesKeepsNoSession) {
   EXPECT_EQ(framework_.waitingDiscoveries(), 1U);
 }
 
-TEST_F(SessionLinkTest, ACallbackForASessionThatIsGoneOnlyLogs) {
+TEST_F(SessionLinkTest, ACallbackForADestroyedSessionOnlyLogs) {
   holdDiscoveries();
   start();
   platform_.dispatch.advance(9s);

@@ -7,17 +7,17 @@
 
 namespace halvox {
 
-// What the sources of the session log with.
+// The log of this folder's sources. All log under the session's name; tools match it.
 inline constexpr platform::UnitLog kSessionLog(&HVReportingSessionCategory, "HVReportingSession");
 
-// The vocabulary's values as log lines show them.
+// Values of the vocabulary as log lines show them.
 constexpr std::int64_t number(ReporterID reporterID) {
   return static_cast<std::int64_t>(reporterID);
 }
 constexpr std::uint16_t number(AudioServiceType serviceType) {
   return static_cast<std::uint16_t>(serviceType);
 }
-// Signed, as categories have always been logged.
+// Signed: tools expect categories in this form.
 constexpr std::int32_t number(AudioEventCategory category) {
   return static_cast<std::int32_t>(category);
 }

@@ -8,8 +8,8 @@
 
 #include "session/SummaryFixture.h"
 
-// The summary files of internal builds. In a program of their own: whether this is an internal
-// build is asked once a process.
+// The summary files of internal builds. A program of its own: a process queries only once whether
+// this is an internal build.
 namespace halvox {
 namespace {
 
@@ -152,7 +152,7 @@ TEST_F(SessionSummaryFileTest, ADirectoryThatCannotBeMadeIsLoggedAndTheFileTried
   EXPECT_EQ(platform_.files.steps().back(), "commit");
 }
 
-TEST_F(SessionSummaryFileTest, AFileThatCannotBeWrittenIsLoggedAndTheStopGoesOn) {
+TEST_F(SessionSummaryFileTest, AFileThatCannotBeWrittenIsLoggedAndTheStopContinues) {
   platform_.files.setFileError(platform::Error{.description = "no space left"});
   send({{"foo", 1}});
 

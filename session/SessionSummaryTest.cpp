@@ -83,7 +83,7 @@ TEST_F(SessionSummaryTest, AClientsOwnSummaryKeyFollowsTheServiceType) {
 
 // --- stop ---------------------------------------------------------------------------------------
 
-TEST_F(SessionSummaryTest, StopOfAnEmptyRunTellsNothing) {
+TEST_F(SessionSummaryTest, StopOfAnEmptyRunReportsNothing) {
   platform_.journal.clear();
 
   session_->stop();
@@ -92,7 +92,7 @@ TEST_F(SessionSummaryTest, StopOfAnEmptyRunTellsNothing) {
               ElementsAre("ending session 7", "ending session 7", "0x21044830"));
 }
 
-TEST_F(SessionSummaryTest, StopWithoutStartTellsNothing) {
+TEST_F(SessionSummaryTest, StopWithoutStartReportsNothing) {
   session_->stop();
   platform_.journal.clear();
 

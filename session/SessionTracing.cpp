@@ -173,7 +173,8 @@ void SessionTracing::kqTraceDidStop(const std::optional<Error>& error) {
 
 void SessionTracing::kqTraceDidComplete(const std::string& url, std::uint64_t /*token*/,
                                         const std::optional<Error>& error) {
-  // Whoever waits for the signal finds the trace gone, but the URL may come after it.
+  // The trace is released before the signal and the URL is stored after it; this order is required.
+  // A stop that waits for the signal may therefore return before the URL is there.
   const auto trace = std::exchange(state_.lock()->session, nullptr);
   if (trace != nullptr) trace->setDelegate({});
   mTraceDispatchSemaphore_->signal();

@@ -57,11 +57,11 @@ class SessionTracingTest : public testing::Test {
     platform_.ktrace.setEvents(
         {{.timestamp = begin, .debugid = 0x21040010}, {.timestamp = end, .debugid = 0x21040014}});
   }
-  // What the back-ends do by themselves.
+  // Runs what the back-ends do on their own queues.
   void letRun() { platform_.dispatch.runUntilIdle(); }
-  // The operations of both back-ends.
+  // The operations that both back-ends were asked for.
   Texts operations() const { return platform_.journal.texts(JournalKind::kNote); }
-  // The lines of that level about traces, those of the start hook included.
+  // The lines of one level and category.
   Texts lines(LogLevel level, std::string_view category) const {
     Texts texts;
     for (const auto& line : platform_.log.lines(level)) {
@@ -162,7 +162,7 @@ TEST_F(SessionTracingTest, LinkIsAskedForBeforeTheTraceIsSetUp) {
   session_->stop();
 }
 
-// A trace may begin and fail while it is asked to start.
+// A trace may begin and fail before the call that starts it returns.
 TEST_F(SessionTracingTest, SessionIsMarkedAsTracedBeforeTheTraceIsAskedToStart) {
   std::vector<std::string> asked;
   platform_.journal.whenRecorded([&](const platform::JournalEntry& entry) {
@@ -307,8 +307,8 @@ TEST_F(SessionTracingTest, FrameworkTraceEndsWithItsURL) {
             (Texts{"Performance Trace Stopped", "Performance Trace Completed: /traces/one"}));
 }
 
-// Whoever waits for the trace goes on at the signal: the trace is forgotten before, and its URL
-// comes after.
+// The signal wakes the thread that waits for the trace. The trace is released before the signal and
+// the URL is stored after it.
 TEST_F(SessionTracingTest, CompletionForgetsTheTraceThenSignalsThenStoresTheURL) {
   session_->start();
   forgetWhatHappened();
@@ -326,7 +326,7 @@ TEST_F(SessionTracingTest, CompletionForgetsTheTraceThenSignalsThenStoresTheURL)
   EXPECT_EQ(session_->tracing().getKQTraceFileURL(), "file:///one");
 }
 
-TEST_F(SessionTracingTest, StartOfATraceIsToldInTheGeneralLogToo) {
+TEST_F(SessionTracingTest, StartOfATraceIsWrittenToTheGeneralLogToo) {
   session_->start();
   EXPECT_TRUE(lines(LogLevel::kInfo, "hvrt").empty());
 
@@ -355,7 +355,7 @@ TEST_F(SessionTracingTest, StopAfterAFailedStartWaitsForWhatNeverComes) {
   letRun();
   forgetWhatHappened();
 
-  // The fake throws where a thread would stand still for ever.
+  // The fake throws where a thread would wait for ever.
   EXPECT_THROW(session_->stop(), std::logic_error);
 
   EXPECT_TRUE(operations().empty());
@@ -371,9 +371,9 @@ TEST_F(SessionTracingTest, FailedStopClearsTheTrace) {
   EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidStop disk"});
 }
 
-// The end of a trace is the last thing that a stop waits for: from there on this thread holds the
-// history. The stop cannot take it, and the session stays marked as started all the while.
-TEST_F(SessionTracingTest, StopClearsTheFlagWhenTheHistoryIsGone) {
+// The end of a trace is the last thing that a stop waits for. From there on this thread holds the
+// history: the stop cannot take it, and the session must stay marked as started.
+TEST_F(SessionTracingTest, StopClearsTheFlagAfterTheHistory) {
   constexpr int kRounds = 10;
   constexpr int kYields = 50;
   platform_.performanceTraces.completeAtStop("file:///one");
@@ -403,7 +403,7 @@ TEST_F(SessionTracingTest, CompletionWithAnErrorEndsTheWaitWithoutAURL) {
   platform_.performanceTraces.failSaves("not saved");
   session_->start();
 
-  session_->stop();  // would stand still without the signal
+  session_->stop();  // would never return without the signal
 
   EXPECT_EQ(session_->tracing().getKQTraceFileURL(), std::nullopt);
   EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidComplete not saved"});
@@ -411,7 +411,7 @@ TEST_F(SessionTracingTest, CompletionWithAnErrorEndsTheWaitWithoutAURL) {
 
 TEST_F(SessionTracingTest, BackEndIsChosenAgainAtTheStop) {
   session_->start();
-  chooseRunner();  // the framework records, but now the runner is chosen, and there is none
+  chooseRunner();  // the framework records, but the stop looks for a runner, and there is none
   forgetWhatHappened();
 
   session_->stop();
@@ -454,13 +454,13 @@ TEST_F(SessionTracingTest, ATraceThatNoStopEndedIsGivenUpForTheNextOne) {
   EXPECT_EQ(platform_.performanceTraces.recordings(), 0U);
 }
 
-TEST_F(SessionTracingTest, NothingIsHeardOfATraceThatWasReplaced) {
+TEST_F(SessionTracingTest, CallbacksOfAReplacedTraceAreIgnored) {
   platform_.performanceTraces.failStarts("no recorder");
   session_->start();
   chooseRunner();
   session_->stop();
   chooseFramework();
-  session_->start();  // both starts are still to come
+  session_->start();  // neither callback of the two starts has run yet
   const auto second = session_->tracing().traceSession();
   platform_.performanceTraces.failStarts("");
 
@@ -477,13 +477,13 @@ TEST_F(SessionTracingTest, StopOfTheFrameworkWhileTheRunnerRecordsWaitsForATrace
   letRun();
   chooseFramework();
 
-  // There is none, so none completes: the wait has no end, on purpose.
+  // The framework has no trace, so none completes and the wait never ends. This is required.
   EXPECT_THROW(session_->stop(), std::logic_error);
 
   EXPECT_TRUE(session_->started());
 }
 
-TEST_F(SessionTracingTest, NothingRecordsForASessionThatIsGone) {
+TEST_F(SessionTracingTest, NothingRecordsForADestroyedSession) {
   for (const bool isRunner : {true, false}) {
     isRunner ? chooseRunner() : chooseFramework();
     session_->start();
@@ -537,7 +537,7 @@ TEST_F(SessionTracingTest, NextRunDoesNotTraceAgainWhatIsStillTraced) {
   EXPECT_TRUE(operations().empty());
 }
 
-TEST_F(SessionTracingTest, StopWaitsForTheTraceBehindTheLinkBeforeTheRunEnds) {
+TEST_F(SessionTracingTest, StopWaitsForTheTraceAfterTheLinkBeforeTheRunEnds) {
   session_->setTlmReportingEnabled(true);
   session_->start();
   session_->sendMessage(Dictionary{{"a", 1}}, AudioEventCategory::kPlayback, AudioEventType::kStart,
@@ -546,12 +546,12 @@ TEST_F(SessionTracingTest, StopWaitsForTheTraceBehindTheLinkBeforeTheRunEnds) {
 
   platform_.performanceTraces.hang();
 
-  EXPECT_THROW(session_->stop(), std::logic_error);  // stands still in the wait
+  EXPECT_THROW(session_->stop(), std::logic_error);  // waits for ever
 
   const Texts all = platform_.journal.texts();
   const auto summary = std::ranges::find(all, "sending summary event for reporter 7");
   EXPECT_NE(std::find(summary, all.end(), "trace stop"), all.end());
-  // The link's last job was added before the wait, in which the fake lets it run.
+  // The link's last job was added before the wait, during which the fake runs it.
   EXPECT_NE(std::ranges::find(all, "entering tlmreporting -[HVReportingSession stop]_block_invoke"),
             all.end());
   EXPECT_TRUE(session_->started());

@@ -50,7 +50,7 @@ TEST_F(SingleMessageTest, LogsADeltaOfZeroForOtherServicesThanAlarms) {
               ElementsAre("sending single message after delta 0 for service 5"));
 }
 
-TEST_F(SingleMessageTest, GoesOutAfterOneSecondOnTheBackgroundQueue) {
+TEST_F(SingleMessageTest, IsSentAfterOneSecondOnTheBackgroundQueue) {
   send(AudioServiceType::kHaptics);
   platform_.journal.clear();
 
@@ -80,7 +80,7 @@ TEST_F(SingleMessageTest, AlarmsDrawADeltaBelowAMinute) {
   EXPECT_GT(deltas.size(), 10U);
 }
 
-// One of the sixty is missing from so many draws once in 10^35 runs.
+// With so many draws, one of the sixty values is missing once in 10^35 runs.
 TEST_F(SingleMessageTest, AlarmsDrawEachSecondOfAMinute) {
   for (int round = 0; round < 5000; ++round) send(AudioServiceType::kAlarms);
 
@@ -122,7 +122,7 @@ TEST_F(SingleMessageTest, EveryMessageIsAccountedFor) {
                                     testing::Pair("failed", 1U)));
 }
 
-TEST_F(SingleMessageTest, TellsTheFrameworkThatItHasNoSession) {
+TEST_F(SingleMessageTest, HasNoSessionInItsSessionInfo) {
   send(AudioServiceType::kHaptics);
   platform_.dispatch.advance(1s);
 
@@ -133,7 +133,7 @@ TEST_F(SingleMessageTest, TellsTheFrameworkThatItHasNoSession) {
                                               {"TLMReportingSessionInfoSessionID", -1}}));
 }
 
-TEST_F(SingleMessageTest, TellsTheFrameworkTheServiceAndNothingOfTheUserInfo) {
+TEST_F(SingleMessageTest, NamesTheServiceInItsUserInfoAndNothingElseOfTheSession) {
   send(AudioServiceType::kHaptics);
   platform_.dispatch.advance(1s);
 
@@ -221,7 +221,7 @@ TEST_F(SingleMessageTest, IsChargedToItsSenderUntilTheFrameworkTookIt) {
   EXPECT_EQ(sender->use().bytes, 0U);
 }
 
-TEST_F(SingleMessageTest, GoesOutWhenItsSenderHasGone) {
+TEST_F(SingleMessageTest, IsSentAfterItsSenderHasLeft) {
   auto sender = std::make_shared<ResourceAccount>();
   const std::weak_ptr<ResourceAccount> watched = sender;
   HVReportingSession::sendSingleMessage(Dictionary{{"a", 1}}, AudioEventCategory::kPlayback,

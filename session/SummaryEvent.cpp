@@ -23,7 +23,7 @@ void appendText(std::string& text, const Value& value) {
 
 }  // namespace
 
-// A message may carry that key too: its values then follow the service type.
+// A message may use this key too. Its values then follow the service type.
 SummaryEvent::SummaryEvent(AudioServiceType serviceType) {
   appendText(columnOf(kServiceTypeKey).text, number(serviceType));
 }
@@ -52,7 +52,7 @@ Dictionary SummaryEvent::take() {
   event.reserve(columns_.size());
   for (Column& column : columns_) {
     event.set(column.key, Value(column.text));
-    std::string().swap(column.text);  // at once: the texts of a long history are large
+    std::string().swap(column.text);  // frees each large text before the next one is copied
   }
   columns_.clear();
   likely_ = 0;

@@ -10,18 +10,19 @@
 
 namespace halvox {
 
-// Puts a session's summary event together: for each key, the texts of all values that it had,
-// joined by ",". Strings stand as they are, numbers in their shortest decimal form, everything else
-// as log lines show it.
+// Builds a session's summary event: for each key, the texts of all its values, joined by ",".
+// Strings are unchanged, numbers have their shortest decimal form, and other values look as in log
+// lines.
 //
-// One growing text a key, so that a long history costs its texts and no list of values. Keys keep
-// the order in which they came up, the service type first. Belongs to one thread.
+// Keeps one growing text for each key instead of lists of values: a long history then takes only
+// the memory of the texts. Keys keep the order of their first use; the service type is first.
+// Belongs to one thread; made and used up by one stop.
 class SummaryEvent {
  public:
   explicit SummaryEvent(AudioServiceType serviceType);
 
   void add(const platform::Dictionary& message);
-  // The event; leaves nothing behind.
+  // Returns the event and empties this object.
   [[nodiscard]] platform::Dictionary take();
 
  private:
@@ -37,7 +38,8 @@ class SummaryEvent {
 
   std::vector<Column> columns_;
   std::unordered_map<platform::Key, std::size_t, KeyHash> positions_;
-  // Messages of a kind have the same keys in the same order, so the next column is mostly right.
+  // The column after the last one used. Messages of one kind have the same keys in the same order,
+  // so it is usually the next one needed and saves a look-up.
   std::size_t likely_ = 0;
 };
 

@@ -7,7 +7,7 @@
 namespace halvox {
 namespace {
 
-constexpr std::size_t kMaxNameLength = 255;
+constexpr std::size_t kMaxNameLength = 255;  // the limit of Linux file systems, in bytes
 constexpr char kSubstitute = '_';
 // The first byte of the characters from U+0080 to U+00BF in UTF-8.
 constexpr unsigned char kLatinLead = 0xC2;
@@ -24,7 +24,7 @@ std::string stamp(const platform::LocalTime& time) {
 
 bool isContinuation(char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U; }
 
-// The longest beginning of at most that many bytes that ends with a whole character.
+// The first `length` bytes of the text, or fewer so that no character is split.
 std::string_view cut(std::string_view text, std::size_t length) {
   if (text.size() <= length) return text;
   while (length > 0 && isContinuation(text[length])) --length;

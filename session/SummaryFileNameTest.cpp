@@ -21,7 +21,7 @@ const platform::LocalTime kTime{.year = 2023,
 std::string nameOf(std::string_view appName) {
   return makeSummaryFileName({.time = kTime, .appName = appName, .serviceName = "haptics"});
 }
-// The part that the application's name became.
+// The part of the file name that comes from the application's name.
 std::string appPart(std::string_view appName) {
   const std::string beginning = "20231114-020304+0530-halvox-";
   const std::string end = "-haptics.json";

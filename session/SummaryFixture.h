@@ -9,7 +9,7 @@
 
 namespace halvox {
 
-// A started session that can be stopped, without the link.
+// A started session without the link.
 class SummaryFixture : public testing::Test {
  protected:
   SummaryFixture() {

@@ -7,7 +7,7 @@
 
 namespace halvox {
 
-// The marks that requests and sessions leave in the system trace.
+// The trace points of requests and sessions. Tools match the codes.
 enum class ReportingTracePoint : std::uint32_t {
   kCreateRequest = 0x21044814,
   kStartRequest = 0x21044818,

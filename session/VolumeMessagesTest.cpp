@@ -24,7 +24,7 @@ using testing::SizeIs;
 
 class VolumeMessagesTest : public testing::Test {
  protected:
-  // A client says that at that stamp it plays, or not, at that volume.
+  // A message of a client that plays, or does not play, at a volume at the time of a stamp.
   void playing(const Value& volume, double stamp) { volumeMessage(volume, 1, stamp); }
   void silent(const Value& volume, double stamp) { volumeMessage(volume, 0, stamp); }
   void volumeMessage(const Value& volume, const Value& state, const Value& stamp) {
@@ -38,7 +38,7 @@ class VolumeMessagesTest : public testing::Test {
   std::vector<Dictionary> messages(double minimum) const {
     return HVReportingSession::createVolumeMessages(history_, minimum);
   }
-  // What all have under a key.
+  // The values under a key in all messages.
   std::vector<std::string> texts(std::string_view key, double minimum = 1) const {
     std::vector<std::string> result;
     for (const Dictionary& message : messages(minimum)) {
@@ -46,7 +46,7 @@ class VolumeMessagesTest : public testing::Test {
     }
     return result;
   }
-  // "volume: seconds" of each.
+  // "volume: seconds" for each message.
   std::vector<std::string> intervals(double minimum = 1) const {
     std::vector<std::string> result;
     for (const Dictionary& message : messages(minimum)) {
@@ -232,7 +232,7 @@ TEST_F(VolumeMessagesTest, AStateAsTextSaysThatNothingPlays) {
 TEST_F(VolumeMessagesTest, AStateIsReadAsAnInteger) {
   volumeMessage(0.5, true, 10);
   volumeMessage(0.5, -2, 20);
-  volumeMessage(0.5, 0.9, 30);  // no whole player
+  volumeMessage(0.5, 0.9, 30);  // less than 1 reads as 0
   volumeMessage(0.5, 0.9, 40);
 
   EXPECT_THAT(intervals(), ElementsAre("0.5: 20"));
@@ -263,7 +263,7 @@ TEST_F(VolumeMessagesTest, AStampThatIsNoNumberAtAllGivesNoInterval) {
 TEST_F(VolumeMessagesTest, WithoutAStampNoIntervalOpens) {
   add({{"RQSessionVolume", 0.5}, {"RQSessionVolumePlayingState", 1}});
   silent(0.5, 20);
-  volumeMessage(0.5, 1, "30");  // a text is no stamp
+  volumeMessage(0.5, 1, "30");  // text is not a stamp
   silent(0.5, 40);
 
   EXPECT_THAT(messages(0), IsEmpty());
