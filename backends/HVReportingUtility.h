@@ -66,7 +66,7 @@ double HVReportingUtilityVolumeMinimumPlayingTime(AudioServiceType serviceType);
 
 // Queries once, at the first call, whether this device runs an internal build, and keeps the
 // answer. No answer, or one that is not a boolean, means no. Any thread may call; concurrent first
-// calls query the device once. A class so that tests can have an answer of their own.
+// calls query the device once. It is a class so that a test can have an answer of its own.
 class HVReportingInternalBuildAnswer {
  public:
   bool isInternalBuild();

@@ -13,8 +13,8 @@ using platform::Value;
 namespace {
 
 // Returns the number in decimal digits without an exponent: all digits of an integer, and the
-// shortest digits of a fraction that read back as the same number. 0.35 thus rounds as "0.35", as
-// its writer expects, and not as the slightly smaller binary value.
+// shortest digits of a fraction that read back as the same number. Therefore 0.35 is halfway
+// between 0.3 and 0.4, as its writer expects, although its binary value is slightly smaller.
 std::string plainDecimal(const Value& number) {
   // The longest text is that of the smallest doubles: a sign, "0.", 323 zeros and 17 digits.
   std::array<char, 400> buffer;

@@ -98,7 +98,7 @@ HVReportingUtilityVEKStateManager::Reporter HVReportingUtilityVEKStateManager::a
   return ailmentReporter_;
 }
 
-// The parameter takes the old reporter, which is thus destroyed after the lock is released.
+// The parameter takes the old reporter, which is destroyed after the lock has been released.
 void HVReportingUtilityVEKStateManager::setAilmentReporter(Reporter reporter) {
   const std::lock_guard held(mutex_);
   std::swap(ailmentReporter_, reporter);

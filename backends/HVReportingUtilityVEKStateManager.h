@@ -42,9 +42,8 @@ class HVReportingUtilityVEKStateManager {
     return type == AudioEventType::kJoulebook;
   }
   // Handles a message that the process `processName` (null: unknown) sent through `session`, which
-  // must not be null. Ignores messages that do not report a session left running (a type that
-  // concerns it, with the active time). Does not block: the reply of the snapshot comes later, on
-  // another thread.
+  // must not be null. Ignores messages of other types and messages without an active hardware time.
+  // Does not block: the reply of the snapshot comes later, on another thread.
   void handleEvent(const platform::Message& message, AudioEventCategory category,
                    AudioEventType type, const std::shared_ptr<HVReportingSession>& session,
                    std::optional<std::string_view> processName);
@@ -63,7 +62,7 @@ class HVReportingUtilityVEKStateManager {
   void takeSnapshot(AudioEventCategory category, const HVReportingSession& session,
                     std::optional<std::string_view> processName);
 
-  std::atomic<std::uint64_t> leakedHapticsSessionCounter_{0};  // relaxed: orders with nothing
+  std::atomic<std::uint64_t> leakedHapticsSessionCounter_{0};  // orders nothing else
   mutable std::mutex mutex_;  // held only to copy or exchange the members below
   Reporter ailmentReporter_;
   platform::Dictionary messageCache_;

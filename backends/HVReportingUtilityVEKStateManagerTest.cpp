@@ -159,7 +159,7 @@ TEST_F(HVReportingUtilityVEKStateManagerTest, TheReplyIsOnlyLogged) {
   expectNothingCounted();
 }
 
-TEST_F(HVReportingUtilityVEKStateManagerTest, TheReplyMayComeWhenTheManagerIsGone) {
+TEST_F(HVReportingUtilityVEKStateManagerTest, TheReplyMayComeAfterTheManagerIsDestroyed) {
   {
     HVReportingUtilityVEKStateManager brief;
     brief.handleEvent(reportA(), kSession, AudioEventType::kJoulebook, session_, "player");

@@ -92,8 +92,9 @@ enum class AudioServiceType : std::uint16_t {
 // The subsystem under which all components log.
 inline constexpr std::string_view kHVReportingLogSubsystem = "com.tarno.halvox";
 
-// The log categories of the components. Each is made on first use and lives as long as the process.
-// Any thread may call.
+// The log categories of the components. Each is created on first use and lives as long as the
+// process. Any thread may call. Nothing logs to HVReportingClientCategory; it is required all the
+// same.
 platform::LogCategory& HVReportingClientCategory();
 platform::LogCategory& HVReportingServiceDelegateCategory();
 platform::LogCategory& HVReportingSessionCategory();

@@ -46,7 +46,7 @@ class HVReportingZUBBridgeTest : public testing::Test {
   platform::FakePlatform platform_;
 };
 
-TEST_F(HVReportingZUBBridgeTest, AnIssueIsPostedWithAllThatItTellsAndNoTimestamp) {
+TEST_F(HVReportingZUBBridgeTest, AnIssueIsPostedWithAllItsFieldsAndNoTimestamp) {
   handle(Dictionary{{"issue_type", "glitch"},
                     {"rtaid_client", "x"},
                     {"node", "mixer"},
