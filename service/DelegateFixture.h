@@ -13,8 +13,7 @@
 
 namespace halvox {
 
-// The whole service as a client object sees it, without other clients. Tests override what they
-// look at.
+// A service without other clients. Tests override the operations that they observe.
 class TestDelegate : public HVReportingServiceDelegateProtocol {
  public:
   [[nodiscard]] const platform::Dictionary& getDefaults() const override { return defaults_; }
@@ -46,7 +45,7 @@ class TestDelegate : public HVReportingServiceDelegateProtocol {
   std::int64_t count_ = 0;
 };
 
-// One client object of such a service.
+// A client object of a service on fakes. Jobs of the reporting queue run when run() is called.
 template <typename Delegate>
 class DelegateFixture : public testing::Test {
  protected:

@@ -10,7 +10,7 @@ using platform::JournalKind;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-// The road of messages to the back-ends that take only some, on a build that is not internal.
+// Which messages reach which back-ends, on a build that is not internal.
 class HVReportingBackEndsTest : public ServiceFixture {
  protected:
   HVReportingBackEndsTest() {
@@ -30,7 +30,8 @@ class HVReportingBackEndsTest : public ServiceFixture {
   void sendToActive(AudioEventType type, const Dictionary& message) {
     sendOf(type, platform::Array{}, message);
   }
-  // What reached the back-ends and the session, in order: the session shows by its trace point.
+  // What reached the back-ends and the session, in order. The session's trace point stands for the
+  // session.
   std::vector<std::string> deliveries() const {
     std::vector<std::string> texts;
     for (const JournalEntry& entry : platform_.journal.entries(
@@ -86,7 +87,7 @@ TEST_F(HVReportingBackEndsTest, AnEngineReportForActiveSessionsIsLoggedAfterTheS
                           "com.tarno.unknown.Playback.Joulebook", "Oxbow_Haptics"));
 }
 
-TEST_F(HVReportingBackEndsTest, EverySessionNamedIsHandedOnItsOwn) {
+TEST_F(HVReportingBackEndsTest, EachNamedSessionIsPassedSeparately) {
   createAndStart(client_, 8);
   const std::vector<platform::Value> lists{platform::Array{7, 8, 7, 99}};
 

@@ -29,10 +29,10 @@ const RequestCounters& counters() {
   return made;
 }
 
-// The name of the process that sends the message now being delivered; none when it has gone. A
-// process may change its name at any time, so the name is that of this moment, and it is looked up
-// for the messages only whose sender anything asks for: a look-up reads a file, about as much work
-// as all the rest of a message.
+// The name of the process whose message is being delivered; none if the process has ended. A
+// process may rename itself at any time, so the name is looked up for each message instead of being
+// kept. A look-up reads a file, about as much work as the rest of a message, so it is made only for
+// the messages whose sender is used.
 std::optional<std::string> senderProcessName(AudioEventType type) {
   if (!HVReportingUtilityVEKStateManager::concerns(type)) return std::nullopt;
   if (!HVReportingUtilityIsInternalBuild()) return std::nullopt;
@@ -77,10 +77,10 @@ HVReportingClientServerInstance::Session HVReportingClientServerInstance::findRe
   return delegate == nullptr ? nullptr : delegate->findReportingSessionForID(reporterID);
 }
 
-// The job holds the client, so that requests of a connection that has ended are carried out, and
-// the request's token, so that the connection knows how much of its work is open. Requests that
-// bring a dictionary charge it from here on: the next request of the client finds in the account
-// what this one will make the service hold.
+// The job holds the client, so that the requests of a connection that has ended are still carried
+// out. It also holds the request's token, by which the connection knows how many of its requests
+// are open. A request with a dictionary charges it before it is queued: the client's next request
+// is then checked against what this one will make the service hold.
 template <typename Work>
 void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight, Work work) {
   counters().received.add();
@@ -171,7 +171,8 @@ void HVReportingClientServerInstance::getAllReporters(ReportersReply reply) {
                [reply = std::move(reply)](auto& client) { client.carryOutGetAllReporters(reply); });
 }
 
-// On the connection's thread, in front of everything that is queued.
+// Runs on the connection's thread, before everything that is queued. No session is stopped and
+// nothing is flushed; this is required.
 void HVReportingClientServerInstance::killService(BoolReply /*reply*/) {
   kServiceLog.notice("DESTROYING SERVICE");
   platform::process().terminate(kKilledExitStatus);

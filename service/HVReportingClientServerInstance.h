@@ -17,14 +17,14 @@
 
 namespace halvox {
 
-// The service's side of one client's connection: the sessions that the client made, and what it
-// asks of them. A client may read, validate and send to sessions of others, but change only its
-// own.
+// The service's side of one client's connection: owns the sessions that the client created and
+// carries out its requests. A client may query, validate and send to the sessions of other clients,
+// but change only its own.
 //
-// Requests arrive on the connection's thread, which only queues them; they are carried out on the
-// reporting queue, where the map of sessions belongs. Held by its connection, by the delegate while
-// it is registered, and by its queued requests; so it is always held by a shared pointer. Nothing
-// here fails: what is asked about an unknown session is answered without an error.
+// Requests arrive on the connection's thread, which only queues them. The work runs on the
+// reporting queue, which also owns the map of sessions. Shared by its connection, by the delegate
+// while it is registered, and by its queued requests, so it is always held by a shared pointer. No
+// operation fails: a request about an unknown session is answered without an error.
 class HVReportingClientServerInstance final
     : public HVReportingServiceProtocol,
       public std::enable_shared_from_this<HVReportingClientServerInstance> {
@@ -33,7 +33,8 @@ class HVReportingClientServerInstance final
   using SessionMap = std::unordered_map<ReporterID, Session>;
   enum class Lookup : std::uint8_t { kOwnSessions, kAcrossAllClients };
 
-  // Keeps `delegate` weakly; without it there are no other clients and reporting is off.
+  // Keeps `delegate` weakly. Without a delegate there are no other clients and reporting is
+  // disabled.
   HVReportingClientServerInstance(platform::ProcessID pid,
                                   std::weak_ptr<HVReportingServiceDelegateProtocol> delegate);
   HVReportingClientServerInstance(const HVReportingClientServerInstance&) = delete;
@@ -44,18 +45,18 @@ class HVReportingClientServerInstance final
   // When the client was registered; none before. Any thread.
   [[nodiscard]] std::optional<platform::Date> clientStartDate() const;
   void setClientStartDate(platform::Date date);
-  // The name of the client's process; none before the registration and for a process that was gone
-  // by then. Any thread.
+  // The name of the client's process; none before the registration, or if the process had already
+  // ended by then. Any thread.
   [[nodiscard]] std::optional<std::string> clientProcessName() const;
   void setClientProcessName(std::optional<std::string> name);
   // Reporting queue only.
   [[nodiscard]] const SessionMap& clientReportingSessionMap() const { return sessions_; }
 
-  // A session of this client, or, when it has none of that ID and the look-up goes across all
-  // clients, whatever the delegate finds. Null when there is none. Reporting queue only.
+  // Looks for a session of this client and then, with kAcrossAllClients, for one of any client.
+  // Null if there is none. Reporting queue only.
   [[nodiscard]] Session findReportingSessionForID(ReporterID reporterID, Lookup lookup) const;
-  // The connection was interrupted or has ended: queues the stopping and dropping of all sessions
-  // and the client's leave. May be called again, which does nothing. Any thread.
+  // The connection was interrupted or has ended. Queues a job that stops and drops all sessions and
+  // removes the client from the service. A second call does nothing. Any thread.
   void handleConnectionError();
 
   void createReportingSession(ReporterID reporterID, BoolReply reply) override;
@@ -77,15 +78,15 @@ class HVReportingClientServerInstance final
 
  private:
   using Delegate = std::shared_ptr<HVReportingServiceDelegateProtocol>;
-  // One message on its way to the back-ends.
+  // A request to send one message.
   struct MessageRequest {
     platform::Message message;
     AudioEventCategory category;
     AudioEventType type;
     ReporterIDs reporterIDs;
-    std::optional<std::string> senderProcessName;  // none: unknown, or not used
+    std::optional<std::string> senderProcessName;  // none: unknown or not needed
     ErrorReply reply;
-    ResourceCharge charge;  // for the message, until the request was carried out
+    ResourceCharge charge;  // for the message, until the request has been carried out
   };
 
   template <typename Work>
@@ -114,8 +115,8 @@ class HVReportingClientServerInstance final
   static void handToBackEnds(const MessageRequest& request, const Session& session,
                              const Delegate& delegate);
 
-  // Changes of the map and of what is in it go through these, which tell the delegate and the
-  // account.
+  // All changes of the map and of its sessions' states go through these: they keep the delegate's
+  // index and the client's account up to date.
   void putSession(const Session& session, const Delegate& delegate);
   void removeSession(SessionMap::iterator place, const Delegate& delegate);
   void note(const Session& session, SessionChange change, const Delegate& delegate) const;

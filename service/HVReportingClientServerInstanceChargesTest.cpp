@@ -7,7 +7,8 @@
 
 #include "service/ServiceFixture.h"
 
-// What is charged to which client while its messages wait: the connection refuses requests by that.
+// What is charged to which client while its messages wait. The connection refuses requests of a
+// client that is over its limit.
 namespace halvox {
 namespace {
 
@@ -83,7 +84,7 @@ TEST_F(HVReportingClientServerInstanceChargesTest, AMessageToAllActiveSessionsIs
   EXPECT_EQ(bytes(sender_), 0U);
 }
 
-TEST_F(HVReportingClientServerInstanceChargesTest, WhatWasAnsweredGoesOutWhenItsClientHasGone) {
+TEST_F(HVReportingClientServerInstanceChargesTest, AnAnsweredMessageIsSentAfterItsClientHasLeft) {
   const Call answered = sendToAll(sender_, large_);
   sender_->invalidate();
   run();

@@ -11,7 +11,8 @@ namespace halvox {
 void HVReportingClientServerInstance::putSession(const Session& session, const Delegate& delegate) {
   session->chargeTo(account_);
   Session& place = sessions_[session->reporterID()];
-  // One that was there is dropped as it is, started or not.
+  // A session that was there is dropped without being stopped, even if it is started. This is
+  // required.
   if (place != nullptr) note(place, SessionChange::kRemoved, delegate);
   place = session;
   note(session, SessionChange::kAdded, delegate);
@@ -38,10 +39,12 @@ void HVReportingClientServerInstance::handleConnectionError() {
 void HVReportingClientServerInstance::carryOutConnectionError() {
   const Delegate delegate = delegate_.lock();
   if (delegate == nullptr) return;
-  // Both an interruption and the end of the connection come here; the second finds nothing to do.
+  // An interruption and the end of the connection both lead here. The second finds the client
+  // removed and does nothing.
   const auto& clients = delegate->getAllClients();
   if (std::ranges::none_of(clients, [this](const auto& one) { return one.get() == this; })) return;
-  // As when a session is destroyed, the counter of active sessions stays and held replies go.
+  // As for a destroyed session, the counter of active sessions does not change and held replies are
+  // dropped. Both are required.
   for (const auto& [reporterID, session] : sessions_) {
     if (session->started()) session->stop();
   }

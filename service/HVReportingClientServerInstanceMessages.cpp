@@ -10,13 +10,13 @@
 #include "session/SessionLog.h"
 #include "session/TracePoints.h"
 
-// The road of a client's message to the back-ends and sessions.
+// How a client's message reaches the back-ends and the sessions.
 namespace halvox {
 namespace {
 
 constexpr std::string_view kErrorDomain = "com.tarno.audio.reporting";
 constexpr std::int64_t kReportingDisabled = 1;
-// What messages that come outside any session are sent as.
+// The reporter ID of messages that are sent while no session is active.
 constexpr ReporterID kStandaloneReporterID{1};
 
 // received = delivered + dropped + refused.
@@ -37,7 +37,7 @@ const MessageCounters& counters() {
   return made;
 }
 
-// The reporter IDs of a request as a log line shows them.
+// Describes the reporter IDs of a request for a log line.
 class ReporterIDsDescription {
  public:
   explicit ReporterIDsDescription(const HVReportingServiceProtocol::ReporterIDs& reporters)
@@ -55,9 +55,9 @@ class ReporterIDsDescription {
   const HVReportingServiceProtocol::ReporterIDs& reporters_;  // owned by the request
 };
 
-// Marks the message with the time of its arrival. Whatever the client sent under these keys goes
-// first, so that the stamps come last and also win over keys that become theirs when blanks are
-// replaced.
+// Adds the time of arrival to the message. Removes what the client sent under these keys first, so
+// that the stamps become the last entries. Sessions replace blanks in keys and keep the later of
+// two equal keys, so a client's "systemuptime sec" does not displace a stamp.
 void stamp(platform::Message& message) {
   static const platform::Key timestamp("hvreporting_timestamp");
   static const platform::Key systemUptime("systemuptime_sec");
@@ -117,8 +117,7 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
     sendStandalone(request, delegate);
     return;
   }
-  // Here the session comes before the back-ends, and for named sessions after them. Both orders are
-  // intended.
+  // Here the session comes first; for named sessions it comes last. Both orders are required.
   for (const Session& session : sessions) {
     session->sendMessage(request.message, request.category, request.type, nullptr, account_);
     handToBackEnds(request, session, delegate);
@@ -140,7 +139,7 @@ void HVReportingClientServerInstance::sendStandalone(const MessageRequest& reque
                                         nullptr, account_);
 }
 
-// Each back-end decides by itself whether the message concerns it.
+// The order is required. Each back-end ignores the messages that do not concern it.
 void HVReportingClientServerInstance::handToBackEnds(const MessageRequest& request,
                                                      const Session& session,
                                                      const Delegate& delegate) {

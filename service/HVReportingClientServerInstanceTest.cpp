@@ -106,7 +106,7 @@ TEST_F(HVReportingClientServerInstanceTest, CleaningUpIsQueuedAndMayBlock) {
   EXPECT_EQ(platform_.dispatch.weights(gReportingQueueName).back(), platform::JobWeight::kMayBlock);
 }
 
-TEST_F(HVReportingClientServerInstanceTest, ADeadProcessLeavesOnlyTheCounterBehind) {
+TEST_F(HVReportingClientServerInstanceTest, OnlyTheCounterRemainsOfADeadProcess) {
   const Call started = createAndStart(client_, 7);
   create(client_, 8);
   create(other_, 9);

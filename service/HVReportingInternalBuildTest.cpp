@@ -9,7 +9,8 @@ using platform::Value;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-// Has the question answered before any service is made: the answer holds for the process.
+// Makes this process an internal build. Must run before the first test, because the process queries
+// it only once.
 class InternalBuild final : public testing::Environment {
  public:
   void SetUp() override {
@@ -92,7 +93,7 @@ TEST_F(HVReportingInternalBuildTest, TheSecondLeakBringsASnapshotOfItsSender) {
                                                  {"detectedProcess", "second"}}));
 }
 
-// The stamps of arrival are part of what is compared.
+// The comparison of two reports includes their time stamps.
 TEST_F(HVReportingInternalBuildTest, OneReportSentTwiceIsTwoOnceTimeHasPassed) {
   reportToSeven(30);
   reportToSeven(30);
@@ -114,7 +115,7 @@ TEST_F(HVReportingInternalBuildTest, StandaloneLeaksCountOnceEach) {
   EXPECT_EQ(*requests()[0].signature.find("type"), Value("standalone"));
 }
 
-TEST_F(HVReportingInternalBuildTest, ASenderThatWasGoneHasNoName) {
+TEST_F(HVReportingInternalBuildTest, ASenderThatHasEndedHasNoName) {
   const Connection gone = connectUnregistered(200, "brief");
   platform_.process.removeProcess(200);
   run();

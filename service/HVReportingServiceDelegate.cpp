@@ -21,15 +21,15 @@ namespace {
 using WeakClient = std::weak_ptr<HVReportingClientServerInstance>;
 
 constexpr std::string_view kUptimeEvent = "com.tarno.halvox.hvreportingclientuptime";
-// The uptime of a client that was never registered.
+// Reported for a client that was never registered.
 constexpr std::int64_t kUnknownUptime = -1;
 
 void handleConnectionError(const WeakClient& weakClient) {
   if (const auto client = weakClient.lock()) client->handleConnectionError();
 }
 
-// How long a client was registered, as the number to report, or kUnknownUptime. Never negative,
-// though the wall clock may have been set back.
+// How long a client was registered, in seconds, or kUnknownUptime. Never negative, although the
+// wall clock may have been set back meanwhile.
 platform::Value clientUptime(const std::optional<platform::Date>& start, platform::ProcessID pid,
                              const std::string& shownName) {
   const platform::Date now = platform::clock().currentDate();
@@ -38,7 +38,7 @@ platform::Value clientUptime(const std::optional<platform::Date>& start, platfor
     return kUnknownUptime;
   }
   if (start->secondsSince1970 > now.secondsSince1970) {
-    // Said the wrong way round, and kept so: the date lies in the future.
+    // The date lies in the future. The wording is part of the interface: tools match it.
     kServiceLog.notice("clientStartDate is in the past. clientpid=", pid,
                        " clientprocessname=", shownName);
   }
@@ -51,7 +51,8 @@ void sendUptimeEvent(const std::string& processName, const platform::Value& upti
   });
 }
 
-// The connection has ended for good. On the connection's thread.
+// The connection has ended for good. Runs on the connection's thread, so the client is read through
+// its thread-safe properties only.
 void handleInvalidation(const WeakClient& weakClient, platform::ProcessID pid) {
   handleConnectionError(weakClient);
   const auto client = weakClient.lock();

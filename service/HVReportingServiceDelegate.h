@@ -18,22 +18,23 @@
 
 namespace halvox {
 
-// The notification by which somebody announces that the service's own settings have changed.
+// The notification that announces a change of the service's own settings.
 inline constexpr std::string_view gReportingNotifydNotificationName = "com.tarno.halvox.reporting";
 
-// The centre of the service: accepts every connection, keeps the list of clients, and answers what
-// client objects ask of the whole. One a process; making it makes the reporting queue,
-// reads the defaults and registers for changes of the watched settings.
+// The centre of the service: accepts every connection, owns the list of clients, and gives client
+// objects access to what they share. There is one in a process. Its construction creates the
+// reporting queue, reads the defaults and registers for changes of the watched settings.
 //
-// Connections come on their own threads, everything about clients runs on the reporting queue. Held
-// by whoever made it, always by a shared pointer, for the life of the process; clients refer to it
-// weakly. No connection is ever refused and nothing here fails.
+// Connections are accepted on their own threads; everything about clients runs on the reporting
+// queue. main.cpp owns it for the life of the process, always by a shared pointer; clients refer to
+// it weakly. No connection is ever refused and no operation fails.
 class HVReportingServiceDelegate final
     : public platform::NSXPCListenerDelegate,
       public HVReportingServiceDelegateProtocol,
       public std::enable_shared_from_this<HVReportingServiceDelegate> {
  public:
-  // One dictionary a watched setting: where it is, and which notification tells of its changes.
+  // One descriptor for each watched setting: its domain, its key, and the notification that
+  // announces its changes.
   using Features = std::vector<platform::Dictionary>;
 
   HVReportingServiceDelegate();
@@ -41,15 +42,14 @@ class HVReportingServiceDelegate final
   HVReportingServiceDelegate& operator=(const HVReportingServiceDelegate&) = delete;
   ~HVReportingServiceDelegate() override = default;
 
-  // Exports a new client object on the connection and queues its registration, so that it comes
-  // before all of the client's requests. Always true.
+  // Exports a new client object on the connection and queues its registration before the connection
+  // can deliver a request. Always returns true.
   bool listenerShouldAcceptNewConnection(
       const std::shared_ptr<platform::NSXPCConnection>& connection) override;
 
-  // The master switch. On from the beginning; nothing in the service turns it off.
+  // The master switch. Enabled from the beginning; only tests disable it.
   void setReportingEnabled(bool enabled);
 
-  // The descriptors of the watched settings.
   [[nodiscard]] const Features& features() const { return features_; }
 
   [[nodiscard]] const platform::Dictionary& getDefaults() const override { return defaults_; }
@@ -79,34 +79,37 @@ class HVReportingServiceDelegate final
  private:
   using Client = std::shared_ptr<HVReportingClientServerInstance>;
 
-  // Lets captures of diagnostics ask for what describeState() gives.
+  // Makes describeState() available to captures of diagnostics.
   void offerState();
-  // All clients and their sessions, as far as there are not too many. On the reporting queue.
+  // Describes the clients and their sessions, up to a bound. Reporting queue only.
   [[nodiscard]] platform::Dictionary describeState() const;
   Client exportClient(platform::NSXPCConnection& connection);
   void registerClient(const Client& client);
 
-  // The settings that are read once, at the start. Reads files.
+  // Reads the defaults. Called once, by the constructor. Reads files.
   static platform::Dictionary HVReportingDefaults();
   static Features makeFeatures();
-  // Registers for each feature and notes its token. A registration that fails is logged only.
+  // Registers for each feature and stores its token. A failed registration is only logged.
   void listenForFeatureStateChanges();
-  // Sends the state of the features to every session of every client. On the reporting queue.
+  // Sends the state of the features to every session of every client. Reporting queue only.
   void handleFeatureChange(platform::NotifyToken token);
 
-  // Taken while a connection is prepared and while a session is looked up across clients.
+  // Held while a connection is prepared and while a session is looked up across clients, and
+  // nowhere else. It guards no data: the list of clients and the index belong to the reporting
+  // queue. The lock and its being recursive are required all the same.
   mutable std::recursive_mutex lock_;
   Clients clients_;     // reporting queue only
   SessionIndex index_;  // reporting queue only
-  // Single values that order with nothing.
+  // Each is read on its own; they order nothing else.
   std::atomic<bool> reportingEnabled_{true};
   std::atomic<std::int64_t> activeSessionCount_{0};
   const platform::Dictionary defaults_;
-  Features features_;  // never changes once made
+  Features features_;  // does not change after construction
   std::unique_ptr<const HVReportingDriverUtility> driverUtility_;
-  // Takes events on the reporting queue only.
+  // Null on builds that are not internal. Reporting queue only.
   std::unique_ptr<HVReportingUtilityVEKStateManager> vekStateManager_;
-  // Ends with this object; those whom it gave handlers that refer to it look here first.
+  // Expires with this object. The handlers that refer to it are registered for the life of the
+  // process, so they check this first.
   const std::shared_ptr<const bool> alive_ = std::make_shared<bool>(true);
 };
 

@@ -12,29 +12,29 @@
 #include "service/RoundedSeconds.h"
 #include "service/ServiceLog.h"
 
-// The settings that tune the service from the outside: the defaults, which are read once, and the
-// watched features, which are read whenever somebody wants to know.
+// The settings that the service reads from the settings store: the defaults, once, and the watched
+// features, each time their state is needed.
 namespace halvox {
 namespace {
 
 using platform::Dictionary;
 
 constexpr std::string_view kOwnDomain = "com.tarno.halvox";
-// The settings of this user are the ones that count.
+// The user whose settings are read.
 constexpr std::string_view kUserName = "mobile";
 
-// What a feature descriptor says.
+// Keys of a feature descriptor.
 constexpr std::string_view kDefaultsDomainKey = "defaults_domain";
 constexpr std::string_view kFeatureDomainKey = "feature_domain";
 constexpr std::string_view kNotificationKey = "notification";
 constexpr std::string_view kNotifyTokenKey = "notify_token";
-// Settings.
+// Names of settings.
 constexpr std::string_view kDeviceNameKey = "device_name";
 constexpr std::string_view kDisableReportingKey = "disable_reporting";
 
 constexpr platform::NotifyToken kNoToken = 0;
 
-// A text of a descriptor, empty when it has none.
+// The text under a key of a descriptor; empty if there is none.
 std::string_view text(const Dictionary& descriptor, std::string_view key) {
   const platform::Value* value = descriptor.find(key);
   return value == nullptr ? std::string_view() : value->string();
@@ -52,7 +52,7 @@ Dictionary HVReportingServiceDelegate::HVReportingDefaults() {
   const NSUserDefaults store(kOwnDomain);
   Dictionary defaults;
   if (store.objectForKey(kDeviceNameKey).has_value()) {
-    // A value that has no text leaves the key out, like none.
+    // A value without a text counts as missing.
     if (auto name = store.stringForKey(kDeviceNameKey)) defaults.set(kDeviceNameKey, *name);
   }
   if (store.objectForKey(kDisableReportingKey).has_value()) {
@@ -96,8 +96,8 @@ void HVReportingServiceDelegate::listenForFeatureStateChanges() {
     const std::string_view notification = text(descriptor, kNotificationKey);
     if (text(descriptor, kDefaultsDomainKey).empty() || notification.empty()) continue;
     platform::NotifyToken token = kNoToken;
-    // Runs on the reporting queue for the life of the process, as this object lives; the token of
-    // life is for those who make a delegate and drop it.
+    // The registration is never cancelled: it lasts for the life of the process, like this object.
+    // Only tests drop a delegate earlier, and for them the handler checks `alive`.
     const platform::NotifyStatus status = platform::notify().notify_register_dispatch(
         notification, token, reportingQueue(),
         [this, alive = std::weak_ptr<const bool>(alive_)](platform::NotifyToken fired) {
@@ -108,8 +108,8 @@ void HVReportingServiceDelegate::listenForFeatureStateChanges() {
   }
 }
 
-// A session start sends only a state that there is. Here it is sent even when there is none, so
-// that sessions hear of the removal of the last setting. Both are intended.
+// Sends the state even if no watched setting has a value, so that sessions learn that the last
+// setting was removed. A session start sends nothing then. Both rules are required.
 void HVReportingServiceDelegate::handleFeatureChange(platform::NotifyToken token) {
   kServiceLog.info("feature ", token, " changes");
   const platform::Message state = getFeaturesState();

@@ -26,7 +26,7 @@ class HVReportingServiceDelegateFeaturesTest : public ServiceFixture {
   }
   ~HVReportingServiceDelegateFeaturesTest() override { platform_.dispatch.clear(); }
 
-  // Another delegate, made with the settings as they are now.
+  // A new delegate, which reads the current settings.
   std::shared_ptr<HVReportingServiceDelegate> remake() {
     forgetSteps();
     platform_.preferences.takeReads();
@@ -39,7 +39,7 @@ class HVReportingServiceDelegateFeaturesTest : public ServiceFixture {
     platform_.notify.post(name);
     run();
   }
-  // The messages in the history of a session that is started.
+  // The messages in the history of a started session.
   static std::vector<Dictionary> received(const Connection& from, std::int64_t id) {
     std::vector<Dictionary> messages;
     const auto session = sessionOf(from, id);
@@ -76,13 +76,13 @@ TEST_F(HVReportingServiceDelegateFeaturesTest, TheDefaultsHoldTheDeviceNameAsASt
   EXPECT_EQ(remake()->getDefaults(), (Dictionary{{"device_name", "42"}, {"disable_reporting", 0}}));
 }
 
-TEST_F(HVReportingServiceDelegateFeaturesTest, ADeviceNameWithoutATextIsLeftOut) {
+TEST_F(HVReportingServiceDelegateFeaturesTest, ADeviceNameWithoutATextIsIgnored) {
   platform_.preferences.set(kOwn, "device_name", platform::Array{"a"});
 
   EXPECT_EQ(remake()->getDefaults(), (Dictionary{{"disable_reporting", 0}}));
 }
 
-TEST_F(HVReportingServiceDelegateFeaturesTest, DisableReportingIsHandedOnAsABoolean) {
+TEST_F(HVReportingServiceDelegateFeaturesTest, DisableReportingIsReadAsABoolean) {
   platform_.preferences.set(kOwn, "disable_reporting", "YES");
 
   const Dictionary defaults = remake()->getDefaults();
@@ -138,7 +138,7 @@ TEST_F(HVReportingServiceDelegateFeaturesTest, TheInitialiserReadsTheDefaultsThe
   EXPECT_EQ(lines(LogLevel::kInfo)[0].find("notify_token"), std::string::npos);
   EXPECT_THAT(lines(LogLevel::kDefault),
               ElementsAre("notify setup result 0 token 1", "notify setup result 0 token 2"));
-  // The drivers come last, after the registrations.
+  // The drivers are set up last, after the registrations.
   EXPECT_THAT(steps()[1], "notify setup result 0 token 1");
   EXPECT_THAT(steps()[2], "notify setup result 0 token 2");
   EXPECT_THAT(steps()[3], "creating ioreporting driver utility");
@@ -158,7 +158,7 @@ TEST_F(HVReportingServiceDelegateFeaturesTest, AFailedRegistrationIsLoggedAndHas
   EXPECT_EQ(*delegate_->features()[1].find("notify_token"), Value(1));
 }
 
-TEST_F(HVReportingServiceDelegateFeaturesTest, ADelegateThatIsGoneHearsOfNothing) {
+TEST_F(HVReportingServiceDelegateFeaturesTest, ADestroyedDelegateIgnoresChanges) {
   delegate_ = nullptr;
   forgetSteps();
 
@@ -244,7 +244,7 @@ TEST_F(HVReportingServiceDelegateFeaturesTest, AStartSendsTheStateAsASetupMessag
 
 TEST_F(HVReportingServiceDelegateFeaturesTest, AStartReadsTheStateBeforeATracingTestIsAnswered) {
   platform_.featureFlags.set("Acoustat", "Tracing", platform::FakeFeatureFlagService::State::kOn);
-  platform_.performanceTraces.hang();  // what it reports later does not matter here
+  platform_.performanceTraces.hang();  // its later callbacks do not matter here
   platform_.preferences.set(kOwn, "device_name", "kitchen");
   const Connection client = connect(100);
   create(client, 7);

@@ -11,7 +11,8 @@
 namespace halvox {
 namespace {
 
-// So many sessions in all are described; describing more would hold up requests.
+// At most this many sessions and clients are described. Describing more would delay requests, since
+// the description is made on the reporting queue.
 constexpr std::size_t kMostDescribed = 5000;
 constexpr std::size_t kMostClients = 5000;
 
@@ -35,7 +36,8 @@ platform::Dictionary describeClient(const HVReportingClientServerInstance& clien
 
 }  // namespace
 
-// The job waits among the requests, so that nothing is looked at while it changes.
+// The description is made by a job of the reporting queue, because nothing else changes clients and
+// sessions meanwhile.
 void HVReportingServiceDelegate::offerState() {
   platform::diagnosticReporters().setStateSource(
       [this, alive = std::weak_ptr<const bool>(alive_)](

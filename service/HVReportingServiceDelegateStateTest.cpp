@@ -1,6 +1,6 @@
 #include "service/ServiceFixture.h"
 
-// The state that the service gives for captures of diagnostics.
+// The state of the service in captures of diagnostics.
 
 namespace halvox {
 namespace {
@@ -9,7 +9,7 @@ using platform::Dictionary;
 
 class HVReportingServiceDelegateStateTest : public ServiceFixture {
  protected:
-  // What the service gives when it is asked; none when it does not answer.
+  // Asks the service for its state; none if it does not answer.
   std::optional<Dictionary> state() {
     std::optional<Dictionary> given;
     platform_.diagnosticReporters.askState([&given](const Dictionary& state) { given = state; });
@@ -19,7 +19,7 @@ class HVReportingServiceDelegateStateTest : public ServiceFixture {
   }
 };
 
-TEST_F(HVReportingServiceDelegateStateTest, TellsTheClientsAndTheirSessions) {
+TEST_F(HVReportingServiceDelegateStateTest, DescribesTheClientsAndTheirSessions) {
   platform_.clock.setCurrentDate({1000});
   const Connection player = connect(12, "player");
   connect(13, "mixer");
@@ -68,7 +68,7 @@ TEST_F(HVReportingServiceDelegateStateTest, DescribesABoundedNumberOfSessionsAnd
   EXPECT_EQ(given.find("sessions_described")->toInt64(), 5000);
 }
 
-TEST_F(HVReportingServiceDelegateStateTest, GivesNothingOnceTheServiceIsGone) {
+TEST_F(HVReportingServiceDelegateStateTest, DoesNotAnswerAfterTheServiceIsDestroyed) {
   delegate_.reset();
 
   EXPECT_EQ(state(), std::nullopt);

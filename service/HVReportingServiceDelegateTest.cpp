@@ -100,7 +100,7 @@ TEST_F(HVReportingServiceDelegateTest, RegistrationSetsDateAndNameInOrderOfAccep
   EXPECT_EQ(clientOf(second)->clientProcessName(), "recorder");
 }
 
-TEST_F(HVReportingServiceDelegateTest, AProcessThatIsGoneHasNoName) {
+TEST_F(HVReportingServiceDelegateTest, AProcessThatHasEndedHasNoName) {
   const Connection connection = connectUnregistered(100);
   platform_.process.removeProcess(100);
   run();
@@ -206,7 +206,7 @@ TEST_F(HVReportingServiceDelegateTest, AConnectionThatEndsBeforeItsRegistrationH
   EXPECT_THAT(platform_.analytics.sentNames(), IsEmpty());
 }
 
-TEST_F(HVReportingServiceDelegateTest, AConnectionWhoseClientIsGoneHasNoUptime) {
+TEST_F(HVReportingServiceDelegateTest, AConnectionWithoutItsClientHasNoUptime) {
   const Connection connection = connectUnregistered(100);
   connection->setExportedObject(nullptr);
   forgetSteps();

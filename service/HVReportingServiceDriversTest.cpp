@@ -3,7 +3,7 @@
 
 #include "service/ServiceFixture.h"
 
-// When sessions sample the drivers and tell what these counted.
+// When sessions sample the drivers and when they report the counts.
 namespace halvox {
 namespace {
 
@@ -12,7 +12,7 @@ using Texts = std::vector<std::string>;
 
 class HVReportingServiceDriversTest : public ServiceFixture {
  protected:
-  // A service that found channels at its start.
+  // The service finds channels when it starts.
   HVReportingServiceDriversTest() {
     setCycles(5);
     delegate_ = std::make_shared<HVReportingServiceDelegate>();
@@ -20,7 +20,7 @@ class HVReportingServiceDriversTest : public ServiceFixture {
     client_ = connect(100);
     forgetSteps();
   }
-  // What the one channel has counted.
+  // Sets what the only channel has counted.
   void setCycles(std::int64_t cycles) {
     platform_.ioReport.setGroup("Speaker-(null)", {{.driverName = "Amp",
                                                     .group = "Speaker",
@@ -28,7 +28,7 @@ class HVReportingServiceDriversTest : public ServiceFixture {
                                                     .integerValue = cycles}});
   }
   Texts operations() const { return platform_.journal.texts(JournalKind::kNote); }
-  // The steps that are named, in the order in which they happened.
+  // Those of the given steps that happened, in their order.
   Texts order(const std::vector<std::string_view>& named) const {
     Texts found;
     for (const std::string& step : steps()) {
@@ -59,7 +59,7 @@ TEST_F(HVReportingServiceDriversTest, SecondStartDoesNotSampleAgain) {
   EXPECT_TRUE(operations().empty());
 }
 
-TEST_F(HVReportingServiceDriversTest, StopTellsTheDifferenceBeforeTheSessionEnds) {
+TEST_F(HVReportingServiceDriversTest, StopReportsTheDifferenceBeforeTheSessionEnds) {
   createAndStart(client_, 7);
   setCycles(12);
   forgetSteps();
@@ -76,7 +76,7 @@ TEST_F(HVReportingServiceDriversTest, StopTellsTheDifferenceBeforeTheSessionEnds
             (Texts{"done getting latest samples", "ending session 7", "ending session 7"}));
 }
 
-TEST_F(HVReportingServiceDriversTest, DestroyingAStartedSessionTellsNothing) {
+TEST_F(HVReportingServiceDriversTest, DestroyingAStartedSessionReportsNothing) {
   createAndStart(client_, 7);
   forgetSteps();
 
@@ -85,7 +85,7 @@ TEST_F(HVReportingServiceDriversTest, DestroyingAStartedSessionTellsNothing) {
   EXPECT_TRUE(operations().empty());
 }
 
-TEST_F(HVReportingServiceDriversTest, EndOfTheConnectionTellsNothing) {
+TEST_F(HVReportingServiceDriversTest, EndOfTheConnectionReportsNothing) {
   createAndStart(client_, 7);
   forgetSteps();
 

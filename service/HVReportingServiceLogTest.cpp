@@ -10,13 +10,13 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::StartsWith;
 
-// Which lines each request leaves in which log at which level: people and programs filter by them.
+// Which lines each request logs, with category and level. People and programs filter by them.
 class HVReportingServiceLogTest : public ServiceFixture {
  protected:
   HVReportingServiceLogTest() { platform_.log.clear(); }
   ~HVReportingServiceLogTest() override { platform_.dispatch.clear(); }
 
-  // "debug hvrs: creating session for reporter 7"; without what links log by themselves.
+  // Each line as "debug hvrs: creating session for reporter 7". Excludes the lines of links.
   std::vector<std::string> logged() {
     std::vector<std::string> texts;
     for (const auto& line : platform_.log.lines()) {
@@ -149,7 +149,7 @@ TEST_F(HVReportingServiceLogTest, MessageForOneSession) {
 
 TEST_F(HVReportingServiceLogTest, MessageForNobody) {
   sendToAll(client_);
-  platform_.analytics.buildPayloads();  // what builds them holds the session until then
+  platform_.analytics.buildPayloads();  // until then the builders hold the session
 
   EXPECT_THAT(logged(),
               ElementsAre("debug hvrs: sending message for reporter (null)",

@@ -30,7 +30,7 @@ HVReportingServiceProtocol& service(ExportedObject& object) {
 
 ReporterID reporterID(const Value& value) { return static_cast<ReporterID>(value.toInt64()); }
 
-// The arguments come with the types of the method's signature, so narrowing loses nothing.
+// The connection has checked the argument's type against the signature, so narrowing loses nothing.
 template <typename Enumeration>
 Enumeration enumeration(const Value& value) {
   return static_cast<Enumeration>(value.toUInt64());
@@ -98,11 +98,13 @@ std::size_t countReporterIDs(std::span<const Value> arguments) {
 }
 
 void invokeSendMessage(ExportedObject& object, Invocation&& request) {
-  // There is no null on the wire: the list comes inside another, which is empty for none.
+  // The wire has no null. The list is wrapped in another one, which is empty if there is no list.
   const Array lists = request.arguments[3].array();
   if (lists.size() > 1) {
     request.reply(
-        Error{.description = "sendMessage: argument 4: more than one list of reporter IDs",
+        Error{.description = "sendMessage: argument 4: expected at most one list of reporter IDs, "
+                             "found " +
+                             std::to_string(lists.size()),
               .name = std::string(kInvalidArguments)},
         Value());
     return;

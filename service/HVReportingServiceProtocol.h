@@ -11,11 +11,11 @@
 
 namespace halvox {
 
-// What clients can ask of the service. A request for a reporter ID that is unknown, or 0, is not an
-// error: it is answered like one that succeeded, or with a default value.
+// What clients can ask of the service. A request about an unknown reporter ID, or about 0, is not
+// an error: it is answered like one that succeeded, or with a default value.
 //
-// The operations run on the connection's thread and return at once; replies come later from another
-// thread, except where stated. No reply is empty.
+// The operations run on the connection's thread and return at once. They call their reply later, on
+// another thread, with the error first. No reply is empty.
 class HVReportingServiceProtocol : public platform::ExportedObject {
  public:
   using ServiceTypeReply = std::function<void(const std::optional<platform::Error>& error,
@@ -24,36 +24,41 @@ class HVReportingServiceProtocol : public platform::ExportedObject {
                                              const platform::Dictionary& dictionary)>;
   using ReportersReply = std::function<void(const std::optional<platform::Error>& error,
                                             const std::vector<ReporterID>& reporters)>;
-  // None is not the same as an empty list: it means all active sessions.
+  // None means all active sessions. An empty list means no session.
   using ReporterIDs = std::optional<std::vector<ReporterID>>;
 
-  // Makes a session under an ID that the client chose, in the place of an older one.
+  // Creates a session under an ID that the client chose. Replaces a session that the client has
+  // under this ID, without stopping it.
   virtual void createReportingSession(ReporterID reporterID, BoolReply reply) = 0;
   virtual void setServiceType(AudioServiceType serviceType, ReporterID reportingSession,
                               BoolReply reply) = 0;
-  // Answers the service type, in spite of its name. Replies twice for ID 0.
+  // Replies with the service type, not a name, and calls the reply twice for ID 0. Clients rely on
+  // both.
   virtual void getServiceNameForReporterID(ReporterID reporterID, ServiceTypeReply reply) = 0;
-  // Adds entries to the configuration of one of the client's sessions.
+  // Adds entries to the configuration of one of the client's own sessions.
   virtual void setConfiguration(platform::Dictionary configuration, ReporterID reporterID,
                                 BoolReply reply) = 0;
-  // Starts one of the client's sessions. The reply is held back until the session is stopped, so
-  // that the client learns when all of it is done.
+  // Starts one of the client's own sessions. Replies when the session is stopped or started again,
+  // which tells the client that the whole run is complete. If the session is destroyed instead, or
+  // its connection ends, the reply is never called.
   virtual void startReportingSessionForID(ReporterID reporterID, BoolReply reply) = 0;
-  // Hands a message to the back-ends and to the sessions named, whichever client made them, or to
-  // all active ones when none are named.
+  // Passes a message to the back-ends and to the named sessions, which may belong to any client.
+  // Without names, passes it to all active sessions.
   virtual void sendMessage(platform::Message message, AudioEventCategory category,
                            AudioEventType type, ReporterIDs reporterIDs, ErrorReply reply) = 0;
   virtual void stopReportingSessionForID(ReporterID reporterID, BoolReply reply) = 0;
   virtual void destroyReportingSession(ReporterID reporterID, BoolReply reply) = 0;
-  // Answers "reporterID" and "serviceType" of a session, 0 and 65535 when there is none.
+  // Replies with "reporterID" and "serviceType" of a session; 0 and 65535 if there is none.
   virtual void reporterIDValid(ReporterID reporterID, DictionaryReply reply) = 0;
-  // Answers the IDs of all sessions of all clients.
+  // Replies with the IDs of all sessions of all clients.
   virtual void getAllReporters(ReportersReply reply) = 0;
-  // Ends the service at once. Never replies. Connections deliver it from the service's owner only.
+  // Ends the process at once with exit status 2. Never replies, and stops or flushes no session.
+  // Connections deliver it only from root and the service's own user.
   virtual void killService(BoolReply reply) = 0;
 };
 
-// The protocol as connections export it: an object of it must be a HVReportingServiceProtocol.
+// The protocol as connections export it. An object that is exported with it must be an
+// HVReportingServiceProtocol.
 const platform::NSXPCInterface& HVReportingServiceInterface();
 
 }  // namespace halvox

@@ -105,7 +105,7 @@ TEST_F(HVReportingServiceProtocolTest, MoreThanOneListOfReporterIDsIsRefused) {
   ASSERT_TRUE(call->replies()[0].error.has_value());
   EXPECT_EQ(call->replies()[0].error->name, "org.freedesktop.DBus.Error.InvalidArgs");
   EXPECT_EQ(call->replies()[0].error->description,
-            "sendMessage: argument 4: more than one list of reporter IDs");
+            "sendMessage: argument 4: expected at most one list of reporter IDs, found 2");
   EXPECT_EQ(platform_.dispatch.waitingJobs(), 0U);
 }
 

@@ -7,8 +7,8 @@ using platform::Dictionary;
 using platform::JournalKind;
 using testing::ElementsAre;
 
-// Keeps the sessions whose messages it is handed for the bug capture. The session of a message that
-// belongs to none is seen here and nowhere else.
+// Keeps the sessions whose messages are passed to the bug capture. This is the only place where a
+// test can see the temporary session of a standalone message.
 class KeepingDelegate final : public TestDelegate {
  public:
   void handleEventForVEK(const platform::Message& message, AudioEventCategory /*category*/,

@@ -9,11 +9,11 @@ namespace halvox {
 // The label of the reporting queue.
 extern const char* const gReportingQueueName;
 
-// The one queue of the process on which clients are registered and all their requests are carried
-// out, one at a time. Null before the first delegate was made. Any thread may ask.
+// The serial queue of the process on which clients are registered and all requests are carried out.
+// Null before the first delegate exists. Any thread may call.
 [[nodiscard]] std::shared_ptr<platform::DispatchQueue> reportingQueue();
 
-// Makes the queue; a later call puts a new one in the place of the old.
+// Creates the queue. A later call replaces it; jobs of the old queue still run there.
 void createReportingQueue();
 
 }  // namespace halvox

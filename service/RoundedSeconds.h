@@ -8,7 +8,7 @@
 
 namespace halvox {
 
-// A time as the number that messages carry: whole seconds, halves away from zero.
+// Rounds a time to whole seconds, as messages carry it: halves away from zero, limited to 32 bits.
 inline std::int32_t roundedSeconds(std::chrono::duration<double> time) {
   using Limits = std::numeric_limits<std::int32_t>;
   return static_cast<std::int32_t>(

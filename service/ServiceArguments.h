@@ -7,18 +7,19 @@
 
 namespace halvox {
 
-// What the service's command line asks for. All settings are in the configuration file, so there is
-// little to ask.
+// What the command line asks of the service. It has no settings: they are all in the configuration
+// file.
 struct ServiceArguments {
   enum class Request : std::uint8_t { kServe, kShowHelp, kShowVersion, kMistake };
   Request request = Request::kServe;
-  std::string mistake{};  // one line for the user, when there is one
+  std::string mistake{};  // with kMistake, one line for the user
 };
 
-// `arguments` are those after the program's name.
+// Parses the arguments after the program's name. Of several requests the first counts, unless any
+// argument is a mistake.
 [[nodiscard]] ServiceArguments parseServiceArguments(std::span<const char* const> arguments);
 
-// The help. It names `configurationFile`, where the service would read its settings now.
+// Returns the help. It names `configurationFile`, which the service would read now.
 [[nodiscard]] std::string serviceHelp(std::string_view configurationFile);
 
 }  // namespace halvox

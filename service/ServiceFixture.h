@@ -14,8 +14,8 @@
 
 namespace halvox {
 
-// A service on fakes and the ways in which its tests play clients. Requests are carried out before
-// the functions return, except with `post`.
+// A service on fakes, with functions that play its clients. Requests have been carried out when a
+// function returns, except with post().
 class ServiceFixture : public testing::Test {
  protected:
   using Connection = std::shared_ptr<platform::FakeConnection>;
@@ -23,10 +23,10 @@ class ServiceFixture : public testing::Test {
 
   ServiceFixture() {
     platform_.connections.serviceListener().setDelegate(*delegate_);
-    forgetSteps();  // those of making the delegate
+    forgetSteps();  // the delegate's construction logs too
   }
 
-  // A client of a new process; registered unless told otherwise.
+  // Connects a new process. connect() also waits for the registration.
   Connection connectUnregistered(platform::ProcessID pid, const std::string& name = "player") {
     platform_.process.addProcess(pid, name);
     return platform_.connections.connect(pid);
@@ -67,13 +67,13 @@ class ServiceFixture : public testing::Test {
     create(from, id);
     return start(from, id);
   }
-  // Sends to the sessions named.
+  // Sends to the named sessions.
   Call send(const Connection& from, const platform::Array& ids,
             const platform::Dictionary& message = {{"a", 1}}) {
     const std::vector<platform::Value> lists{ids};
     return call(from, "sendMessage", {message, kCategory, kType, platform::Array(lists)});
   }
-  // Sends to no session by name.
+  // Sends to all active sessions.
   Call sendToAll(const Connection& from, const platform::Dictionary& message = {{"a", 1}}) {
     return call(from, "sendMessage", {message, kCategory, kType, platform::Array{}});
   }
@@ -99,8 +99,8 @@ class ServiceFixture : public testing::Test {
     platform_.kdebug.clear();
     platform_.analytics.clear();
   }
-  // Everything that was logged, traced, tested, sent and answered, in order, but for what the
-  // sessions' real-time links do on queues of their own: that is no step of the service.
+  // Everything that was logged, traced, tested, sent and answered, in order. Excludes the work of
+  // the sessions' links, which run on queues of their own.
   std::vector<std::string> steps() const {
     std::vector<std::string> texts;
     for (const platform::JournalEntry& entry : platform_.journal.entries()) {

@@ -9,16 +9,16 @@
 
 namespace halvox {
 
-// What the sources of the service core log with; all under the delegate's name.
+// The log of this folder's sources. All log under the delegate's name; tools match it.
 inline constexpr platform::UnitLog kServiceLog(&HVReportingServiceDelegateCategory,
                                                "HVReportingServiceDelegate");
 
-// A log line ends about here whatever is in it, so what a list has beyond is only counted: with
-// thousands of sessions, describing them would cost more than all else that a start does.
+// The bytes after which a list in a log line ends; the remaining elements are only counted. With
+// thousands of sessions, describing all of them would cost more than the rest of a start.
 inline constexpr std::size_t kMaxListText = 8192;
 
-// A list as log lines show it: "(first, second)". Put together only when the line is written.
-// `Append` adds one element to a text. Refers to the list, which must outlive it.
+// Describes a list for a log line: "(first, second, and 7 more)". Builds the text only if the line
+// is written. `Append` appends one element to a text. The list must outlive this.
 template <typename List, typename Append>
 class ListDescription {
  public:
@@ -45,7 +45,7 @@ class ListDescription {
   Append append_;
 };
 
-// The sessions of a list of shared pointers.
+// Describes a list of shared pointers to sessions, which must outlive the result.
 template <typename List>
 auto sessionsDescription(const List& sessions) {
   return ListDescription(

@@ -37,8 +37,8 @@ void SessionIndex::noteChange(const Client& client, const Session& session, Sess
 
 void SessionIndex::add(Place place, const Client& client, const Session& session) {
   Holders& holders = holders_[session->reporterID()];
-  const auto behind = std::ranges::upper_bound(holders, place, {}, &Holder::place);
-  holders.insert(behind, Holder{place, &client, session});
+  const auto later = std::ranges::upper_bound(holders, place, {}, &Holder::place);
+  holders.insert(later, Holder{place, &client, session});
 }
 
 void SessionIndex::remove(Place place, const Session& session) {

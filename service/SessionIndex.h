@@ -10,31 +10,34 @@
 
 namespace halvox {
 
-// Which registered clients have which sessions, and which of these are started: the answers that a
-// walk over all clients in the order of their registration would give, without the walk, because
-// they are needed for every message. Belongs to the delegate and the reporting queue.
+// Finds sessions across all registered clients. Gives the answers of a walk over the clients in the
+// order of their registration, without the walk: every message needs them.
+//
+// Owned by the delegate; reporting queue only. Holds its sessions, so a client must report every
+// session that it drops. No operation fails.
 class SessionIndex {
  public:
   using Client = HVReportingClientServerInstance;
   using Session = std::shared_ptr<HVReportingSession>;
-  // A session and the client that has it; both null when there is none.
+  // A session and its client; both null if there is none.
   struct Found {
     const Client* client = nullptr;
     Session session;
   };
 
-  // A client without sessions was registered, after all others.
+  // Adds a client without sessions, after all others.
   void addClient(const Client& client);
-  // Forgets a client and its sessions, which are given because the client knows them.
+  // Removes a client and its sessions. The caller names the sessions, because finding them here
+  // would take a walk.
   void removeClient(const Client& client, const std::vector<Session>& sessions);
-  // A session of a client changed; ignored for a client that is not registered.
+  // Records a change of a client's session. Ignored for a client that is not registered.
   void noteChange(const Client& client, const Session& session, SessionChange change);
 
-  // The session of that ID, of the client registered first among those that have one.
+  // The session with this ID. If several clients have one, that of the client registered first.
   [[nodiscard]] Found find(ReporterID reporterID) const;
-  // All started sessions: clients in the order of their registration.
+  // All started sessions, in the order in which their clients were registered.
   [[nodiscard]] std::vector<Session> activeSessions() const;
-  // Adds the started sessions of one client.
+  // Appends the started sessions of one client.
   void appendActiveSessions(const Client& client, std::vector<Session>& sessions) const;
 
  private:
@@ -42,10 +45,10 @@ class SessionIndex {
   enum class Place : std::uint64_t {};
   struct Holder {
     Place place;
-    const Client* client;  // registered, hence held by the delegate
+    const Client* client;  // held by the delegate while it is registered
     Session session;
   };
-  using Holders = std::vector<Holder>;  // by place
+  using Holders = std::vector<Holder>;  // sorted by place
   using StartedSessions = std::map<ReporterID, Session>;
 
   void add(Place place, const Client& client, const Session& session);

@@ -46,7 +46,7 @@ int serve(const Configuration& configuration) {
 
 int print(const std::string& text) {
   const bool isWritten = std::fputs(text.c_str(), stdout) >= 0 && std::fflush(stdout) == 0;
-  return isWritten ? EXIT_SUCCESS : refuse(EX_IOERR, "the output cannot be written");
+  return isWritten ? EXIT_SUCCESS : refuse(EX_IOERR, "cannot write to standard output");
 }
 
 int configureAndServe() {
@@ -77,7 +77,8 @@ int run(std::span<const char* const> arguments) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  // A reader of the log that went away and a file that may not grow are errors to count, no ends.
+  // When the reader of a pipe has gone or a file has reached its size limit, the write fails and is
+  // counted. By default these signals would end the process instead.
   std::signal(SIGPIPE, SIG_IGN);
   std::signal(SIGXFSZ, SIG_IGN);
   try {
