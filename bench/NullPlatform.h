@@ -54,11 +54,6 @@ class SteppingClock final : public platform::ClockService {
 class NullConnections final : public platform::ConnectionService {
  public:
   [[noreturn]] platform::NSXPCListener& serviceListener() override { std::abort(); }
-  const platform::NSXPCConnection* currentConnection() const override { return nullptr; }
-  platform::RequestToken currentRequest() const override { return token_; }
-
- private:
-  platform::RequestToken token_ = std::make_shared<int>();
 };
 
 class NullDeviceProperties final : public platform::DevicePropertyService {

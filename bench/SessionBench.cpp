@@ -46,13 +46,14 @@ class Scene {
   }
 
   void restart() {
-    sender().stopReportingSessionForID(target_, ignore);
-    sender().startReportingSessionForID(target_, ignore);
+    sender().stopReportingSessionForID(target_, ignore, context_);
+    sender().startReportingSessionForID(target_, ignore, context_);
     dispatch_.runAll();
   }
   void send(Dictionary message) {
-    sender().sendMessage(std::move(message), AudioEventCategory::kPlayback, AudioEventType::kState,
-                         std::vector{target_}, [](const auto& /*error*/) {});
+    sender().sendMessage(
+        std::move(message), AudioEventCategory::kPlayback, AudioEventType::kState,
+        std::vector{target_}, [](const auto& /*error*/) {}, context_);
   }
   void runAll() { dispatch_.runAll(); }
 
@@ -80,11 +81,13 @@ class Scene {
     delegate_->listenerShouldAcceptNewConnection(connections_.back());
   }
   void startSession(ReporterID reporterID) {
-    sender().createReportingSession(reporterID, ignore);
-    sender().startReportingSessionForID(reporterID, ignore);
+    sender().createReportingSession(reporterID, ignore, context_);
+    sender().startReportingSessionForID(reporterID, ignore, context_);
     dispatch_.runAll();
   }
 
+  // One token for all requests, whose count of holders changes as that of a request's own does.
+  const platform::RequestContext context_{.sender = 100, .token = std::make_shared<int>()};
   bench::ListDispatch& dispatch_;
   std::shared_ptr<HVReportingServiceDelegate> delegate_;
   std::vector<std::shared_ptr<Connection>> connections_;

@@ -57,11 +57,18 @@ class ExportedObject {
 // from piling up work.
 using RequestToken = std::shared_ptr<void>;
 
+// What a request has besides its arguments.
+struct RequestContext {
+  ProcessID sender = 0;  // the process at the other end of the connection; 0 if it is unknown
+  RequestToken token{};  // whoever queues work for the request keeps it in the job
+};
+
 // One request, decoded and checked against the method's signature. The arguments belong to the
 // caller of `invoke` and are valid until it returns; copying a value is cheap.
 struct Invocation {
   std::span<const Value> arguments;
   ReplyCallback reply;  // never empty; does nothing if the client wants no answer
+  RequestContext context;
 };
 
 // Whether a request can make the service hold more for its client. While a client is over its limit
@@ -157,12 +164,6 @@ class ConnectionService {
   virtual ~ConnectionService() = default;
   // The process's own listener.
   virtual NSXPCListener& serviceListener() = 0;
-  // The connection whose request or handler runs on this thread; null on every other thread. Valid
-  // until that request or handler returns.
-  [[nodiscard]] virtual const NSXPCConnection* currentConnection() const = 0;
-  // The token of the request that is being delivered on this thread; null on every other thread.
-  // Code that queues work for the request keeps the token in the job.
-  [[nodiscard]] virtual RequestToken currentRequest() const = 0;
 };
 
 }  // namespace halvox::platform

@@ -4,7 +4,6 @@
 
 #include "backends/HVReportingUtility.h"
 #include "backends/HVReportingUtilityVEKStateManager.h"
-#include "platform/connection.h"
 #include "platform/services.h"
 #include "platform/statistics.h"
 #include "service/ReportingQueue.h"
@@ -29,16 +28,14 @@ const RequestCounters& counters() {
   return made;
 }
 
-// The name of the process whose message is being delivered; none if the process has ended. A
+// The name of the process that sent a message; none if the process has ended. A
 // process may rename itself at any time, so the name is looked up for each message instead of being
 // kept. A look-up reads a file, about as much work as the rest of a message, so it is made only for
 // the messages whose sender is used.
-std::optional<std::string> senderProcessName(AudioEventType type) {
+std::optional<std::string> senderProcessName(AudioEventType type, platform::ProcessID sender) {
   if (!HVReportingUtilityVEKStateManager::concerns(type)) return std::nullopt;
   if (!HVReportingUtilityIsInternalBuild()) return std::nullopt;
-  const platform::NSXPCConnection* connection = platform::connections().currentConnection();
-  if (connection == nullptr) return std::nullopt;
-  return HVReportingUtilityProcessNameForPID(connection->processIdentifier());
+  return HVReportingUtilityProcessNameForPID(sender);
 }
 
 }  // namespace
@@ -82,42 +79,47 @@ HVReportingClientServerInstance::Session HVReportingClientServerInstance::findRe
 // are open. A request with a dictionary charges it before it is queued: the client's next request
 // is then checked against what this one will make the service hold.
 template <typename Work>
-void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight, Work work) {
+void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
+                                                   RequestContext&& context, Work work) {
   counters().received.add();
-  reportingQueue()->async(
-      weight, [client = shared_from_this(), request = platform::connections().currentRequest(),
-               work = std::move(work)]() mutable {
-        work(*client);
-        counters().carriedOut.add();
-      });
-}
-
-void HVReportingClientServerInstance::createReportingSession(ReporterID reporterID,
-                                                             BoolReply reply) {
-  queueRequest(platform::JobWeight::kBrief, [reporterID, reply = std::move(reply)](auto& client) {
-    client.carryOutCreate(reporterID, reply);
+  reportingQueue()->async(weight, [client = shared_from_this(), token = std::move(context.token),
+                                   work = std::move(work)]() mutable {
+    work(*client);
+    counters().carriedOut.add();
   });
 }
 
+void HVReportingClientServerInstance::createReportingSession(ReporterID reporterID, BoolReply reply,
+                                                             RequestContext context) {
+  queueRequest(platform::JobWeight::kBrief, std::move(context),
+               [reporterID, reply = std::move(reply)](auto& client) {
+                 client.carryOutCreate(reporterID, reply);
+               });
+}
+
 void HVReportingClientServerInstance::setServiceType(AudioServiceType serviceType,
-                                                     ReporterID reportingSession, BoolReply reply) {
-  queueRequest(platform::JobWeight::kBrief,
+                                                     ReporterID reportingSession, BoolReply reply,
+                                                     RequestContext context) {
+  queueRequest(platform::JobWeight::kBrief, std::move(context),
                [serviceType, reportingSession, reply = std::move(reply)](auto& client) {
                  client.carryOutSetServiceType(serviceType, reportingSession, reply);
                });
 }
 
 void HVReportingClientServerInstance::getServiceNameForReporterID(ReporterID reporterID,
-                                                                  ServiceTypeReply reply) {
-  queueRequest(platform::JobWeight::kBrief, [reporterID, reply = std::move(reply)](auto& client) {
-    client.carryOutGetServiceName(reporterID, reply);
-  });
+                                                                  ServiceTypeReply reply,
+                                                                  RequestContext context) {
+  queueRequest(platform::JobWeight::kBrief, std::move(context),
+               [reporterID, reply = std::move(reply)](auto& client) {
+                 client.carryOutGetServiceName(reporterID, reply);
+               });
 }
 
 void HVReportingClientServerInstance::setConfiguration(platform::Dictionary configuration,
-                                                       ReporterID reporterID, BoolReply reply) {
+                                                       ReporterID reporterID, BoolReply reply,
+                                                       RequestContext context) {
   ResourceCharge charge(account_, configuration.memorySize());
-  queueRequest(platform::JobWeight::kBrief,
+  queueRequest(platform::JobWeight::kBrief, std::move(context),
                [configuration = std::move(configuration), reporterID, reply = std::move(reply),
                 charge = std::move(charge)](auto& client) {
                  client.carryOutSetConfiguration(configuration, reporterID, reply);
@@ -125,8 +127,9 @@ void HVReportingClientServerInstance::setConfiguration(platform::Dictionary conf
 }
 
 void HVReportingClientServerInstance::startReportingSessionForID(ReporterID reporterID,
-                                                                 BoolReply reply) {
-  queueRequest(platform::JobWeight::kMayBlock,
+                                                                 BoolReply reply,
+                                                                 RequestContext context) {
+  queueRequest(platform::JobWeight::kMayBlock, std::move(context),
                [reporterID, reply = std::move(reply)](auto& client) {
                  client.carryOutStart(reporterID, reply);
                });
@@ -134,40 +137,46 @@ void HVReportingClientServerInstance::startReportingSessionForID(ReporterID repo
 
 void HVReportingClientServerInstance::sendMessage(platform::Message message,
                                                   AudioEventCategory category, AudioEventType type,
-                                                  ReporterIDs reporterIDs, ErrorReply reply) {
+                                                  ReporterIDs reporterIDs, ErrorReply reply,
+                                                  RequestContext context) {
   ResourceCharge charge(account_, message ? message->memorySize() : 0);
+  auto senderName = senderProcessName(type, context.sender);
   queueRequest(
-      platform::JobWeight::kBrief,
+      platform::JobWeight::kBrief, std::move(context),
       [request = MessageRequest{std::move(message), category, type, std::move(reporterIDs),
-                                senderProcessName(type), std::move(reply), std::move(charge)}](
+                                std::move(senderName), std::move(reply), std::move(charge)}](
           auto& client) mutable { client.carryOutSend(request); });
 }
 
 void HVReportingClientServerInstance::stopReportingSessionForID(ReporterID reporterID,
-                                                                BoolReply reply) {
-  queueRequest(platform::JobWeight::kMayBlock,
+                                                                BoolReply reply,
+                                                                RequestContext context) {
+  queueRequest(platform::JobWeight::kMayBlock, std::move(context),
                [reporterID, reply = std::move(reply)](auto& client) {
                  client.carryOutStop(reporterID, reply);
                });
 }
 
 void HVReportingClientServerInstance::destroyReportingSession(ReporterID reporterID,
-                                                              BoolReply reply) {
-  queueRequest(platform::JobWeight::kMayBlock,
+                                                              BoolReply reply,
+                                                              RequestContext context) {
+  queueRequest(platform::JobWeight::kMayBlock, std::move(context),
                [reporterID, reply = std::move(reply)](auto& client) {
                  client.carryOutDestroy(reporterID, reply);
                });
 }
 
-void HVReportingClientServerInstance::reporterIDValid(ReporterID reporterID,
-                                                      DictionaryReply reply) {
-  queueRequest(platform::JobWeight::kBrief, [reporterID, reply = std::move(reply)](auto& client) {
-    client.carryOutReporterIDValid(reporterID, reply);
-  });
+void HVReportingClientServerInstance::reporterIDValid(ReporterID reporterID, DictionaryReply reply,
+                                                      RequestContext context) {
+  queueRequest(platform::JobWeight::kBrief, std::move(context),
+               [reporterID, reply = std::move(reply)](auto& client) {
+                 client.carryOutReporterIDValid(reporterID, reply);
+               });
 }
 
-void HVReportingClientServerInstance::getAllReporters(ReportersReply reply) {
-  queueRequest(platform::JobWeight::kBrief,
+void HVReportingClientServerInstance::getAllReporters(ReportersReply reply,
+                                                      RequestContext context) {
+  queueRequest(platform::JobWeight::kBrief, std::move(context),
                [reply = std::move(reply)](auto& client) { client.carryOutGetAllReporters(reply); });
 }
 

@@ -59,19 +59,25 @@ class HVReportingClientServerInstance final
   // removes the client from the service. A second call does nothing. Any thread.
   void handleConnectionError();
 
-  void createReportingSession(ReporterID reporterID, BoolReply reply) override;
-  void setServiceType(AudioServiceType serviceType, ReporterID reportingSession,
-                      BoolReply reply) override;
-  void getServiceNameForReporterID(ReporterID reporterID, ServiceTypeReply reply) override;
-  void setConfiguration(platform::Dictionary configuration, ReporterID reporterID,
-                        BoolReply reply) override;
-  void startReportingSessionForID(ReporterID reporterID, BoolReply reply) override;
+  void createReportingSession(ReporterID reporterID, BoolReply reply,
+                              RequestContext context) override;
+  void setServiceType(AudioServiceType serviceType, ReporterID reportingSession, BoolReply reply,
+                      RequestContext context) override;
+  void getServiceNameForReporterID(ReporterID reporterID, ServiceTypeReply reply,
+                                   RequestContext context) override;
+  void setConfiguration(platform::Dictionary configuration, ReporterID reporterID, BoolReply reply,
+                        RequestContext context) override;
+  void startReportingSessionForID(ReporterID reporterID, BoolReply reply,
+                                  RequestContext context) override;
   void sendMessage(platform::Message message, AudioEventCategory category, AudioEventType type,
-                   ReporterIDs reporterIDs, ErrorReply reply) override;
-  void stopReportingSessionForID(ReporterID reporterID, BoolReply reply) override;
-  void destroyReportingSession(ReporterID reporterID, BoolReply reply) override;
-  void reporterIDValid(ReporterID reporterID, DictionaryReply reply) override;
-  void getAllReporters(ReportersReply reply) override;
+                   ReporterIDs reporterIDs, ErrorReply reply, RequestContext context) override;
+  void stopReportingSessionForID(ReporterID reporterID, BoolReply reply,
+                                 RequestContext context) override;
+  void destroyReportingSession(ReporterID reporterID, BoolReply reply,
+                               RequestContext context) override;
+  void reporterIDValid(ReporterID reporterID, DictionaryReply reply,
+                       RequestContext context) override;
+  void getAllReporters(ReportersReply reply, RequestContext context) override;
   void killService(BoolReply reply) override;
 
   [[nodiscard]] platform::ResourceUse resourceUse() const override { return account_->use(); }
@@ -90,7 +96,7 @@ class HVReportingClientServerInstance final
   };
 
   template <typename Work>
-  void queueRequest(platform::JobWeight weight, Work work);
+  void queueRequest(platform::JobWeight weight, RequestContext&& context, Work work);
 
   // The work of the requests, on the reporting queue.
   void carryOutCreate(ReporterID reporterID, const BoolReply& reply);

@@ -85,11 +85,11 @@ class HVReportingClientServerInstanceOrderTest : public DelegateFixture<NotingDe
     return delegate_->notes;
   }
   void create() {
-    client_->createReportingSession(kReporter, reply("reply of create"));
+    client_->createReportingSession(kReporter, reply("reply of create"), {});
     run();
   }
   void start(const std::string& name = "reply of start") {
-    client_->startReportingSessionForID(kReporter, reply(name));
+    client_->startReportingSessionForID(kReporter, reply(name), {});
     run();
   }
 };
@@ -130,21 +130,23 @@ TEST_F(HVReportingClientServerInstanceOrderTest, StopTakesItsStepsOneAfterTheOth
   create();
   start();
 
-  EXPECT_THAT(
-      notesOf([this] { client_->stopReportingSessionForID(kReporter, reply("reply of stop")); }),
-      ElementsAre("driver logs: runs, link, snapshot, held reply",
-                  "stopped: idle, link, held reply", "count 0: idle, link, held reply",
-                  "reply of start: idle, link", "active sessions: idle, link",
-                  "reply of stop: idle, link"));
+  EXPECT_THAT(notesOf([this] {
+                client_->stopReportingSessionForID(kReporter, reply("reply of stop"), {});
+              }),
+              ElementsAre("driver logs: runs, link, snapshot, held reply",
+                          "stopped: idle, link, held reply", "count 0: idle, link, held reply",
+                          "reply of start: idle, link", "active sessions: idle, link",
+                          "reply of stop: idle, link"));
 }
 
 TEST_F(HVReportingClientServerInstanceOrderTest, DestroyStopsThenForgetsThenAnswers) {
   create();
   start();
 
-  EXPECT_THAT(
-      notesOf([this] { client_->destroyReportingSession(kReporter, reply("reply of destroy")); }),
-      ElementsAre("removed: idle, link, snapshot, held reply", "reply of destroy: none"));
+  EXPECT_THAT(notesOf([this] {
+                client_->destroyReportingSession(kReporter, reply("reply of destroy"), {});
+              }),
+              ElementsAre("removed: idle, link, snapshot, held reply", "reply of destroy: none"));
 }
 
 TEST_F(HVReportingClientServerInstanceOrderTest,

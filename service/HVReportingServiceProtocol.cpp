@@ -63,13 +63,14 @@ Array numbers(const std::vector<ReporterID>& reporters) {
 
 void invokeCreate(ExportedObject& object, Invocation&& request) {
   service(object).createReportingSession(reporterID(request.arguments[0]),
-                                         boolReply(std::move(request.reply)));
+                                         boolReply(std::move(request.reply)),
+                                         std::move(request.context));
 }
 
 void invokeSetServiceType(ExportedObject& object, Invocation&& request) {
   service(object).setServiceType(enumeration<AudioServiceType>(request.arguments[0]),
                                  reporterID(request.arguments[1]),
-                                 boolReply(std::move(request.reply)));
+                                 boolReply(std::move(request.reply)), std::move(request.context));
 }
 
 void invokeGetServiceName(ExportedObject& object, Invocation&& request) {
@@ -78,18 +79,20 @@ void invokeGetServiceName(ExportedObject& object, Invocation&& request) {
       [reply = std::move(request.reply)](const std::optional<Error>& error,
                                          AudioServiceType serviceType) {
         reply(error, static_cast<std::uint16_t>(serviceType));
-      });
+      },
+      std::move(request.context));
 }
 
 void invokeSetConfiguration(ExportedObject& object, Invocation&& request) {
   service(object).setConfiguration(request.arguments[0].dictionary(),
                                    reporterID(request.arguments[1]),
-                                   boolReply(std::move(request.reply)));
+                                   boolReply(std::move(request.reply)), std::move(request.context));
 }
 
 void invokeStart(ExportedObject& object, Invocation&& request) {
   service(object).startReportingSessionForID(reporterID(request.arguments[0]),
-                                             boolReply(std::move(request.reply)));
+                                             boolReply(std::move(request.reply)),
+                                             std::move(request.context));
 }
 
 std::size_t countReporterIDs(std::span<const Value> arguments) {
@@ -113,20 +116,22 @@ void invokeSendMessage(ExportedObject& object, Invocation&& request) {
   if (!lists.empty()) {
     reporters = reporterIDs(lists[0].array());
   }
-  service(object).sendMessage(request.arguments[0].dictionary(),
-                              enumeration<AudioEventCategory>(request.arguments[1]),
-                              enumeration<AudioEventType>(request.arguments[2]),
-                              std::move(reporters), errorReply(std::move(request.reply)));
+  service(object).sendMessage(
+      request.arguments[0].dictionary(), enumeration<AudioEventCategory>(request.arguments[1]),
+      enumeration<AudioEventType>(request.arguments[2]), std::move(reporters),
+      errorReply(std::move(request.reply)), std::move(request.context));
 }
 
 void invokeStop(ExportedObject& object, Invocation&& request) {
   service(object).stopReportingSessionForID(reporterID(request.arguments[0]),
-                                            boolReply(std::move(request.reply)));
+                                            boolReply(std::move(request.reply)),
+                                            std::move(request.context));
 }
 
 void invokeDestroy(ExportedObject& object, Invocation&& request) {
   service(object).destroyReportingSession(reporterID(request.arguments[0]),
-                                          boolReply(std::move(request.reply)));
+                                          boolReply(std::move(request.reply)),
+                                          std::move(request.context));
 }
 
 void invokeReporterIDValid(ExportedObject& object, Invocation&& request) {
@@ -135,7 +140,8 @@ void invokeReporterIDValid(ExportedObject& object, Invocation&& request) {
       [reply = std::move(request.reply)](const std::optional<Error>& error,
                                          const platform::Dictionary& dictionary) {
         reply(error, dictionary);
-      });
+      },
+      std::move(request.context));
 }
 
 void invokeGetAllReporters(ExportedObject& object, Invocation&& request) {
@@ -143,7 +149,8 @@ void invokeGetAllReporters(ExportedObject& object, Invocation&& request) {
       [reply = std::move(request.reply)](const std::optional<Error>& error,
                                          const std::vector<ReporterID>& reporters) {
         reply(error, numbers(reporters));
-      });
+      },
+      std::move(request.context));
 }
 
 void invokeKillService(ExportedObject& object, Invocation&& request) {

@@ -15,9 +15,11 @@ namespace halvox {
 // an error: it is answered like one that succeeded, or with a default value.
 //
 // The operations run on the connection's thread and return at once. They call their reply later, on
-// another thread, with the error first. No reply is empty.
+// another thread, with the error first. No reply is empty. They keep the token of `context` until
+// their work has been carried out.
 class HVReportingServiceProtocol : public platform::ExportedObject {
  public:
+  using RequestContext = platform::RequestContext;
   using ServiceTypeReply = std::function<void(const std::optional<platform::Error>& error,
                                               AudioServiceType serviceType)>;
   using DictionaryReply = std::function<void(const std::optional<platform::Error>& error,
@@ -29,29 +31,36 @@ class HVReportingServiceProtocol : public platform::ExportedObject {
 
   // Creates a session under an ID that the client chose. Replaces a session that the client has
   // under this ID, without stopping it.
-  virtual void createReportingSession(ReporterID reporterID, BoolReply reply) = 0;
+  virtual void createReportingSession(ReporterID reporterID, BoolReply reply,
+                                      RequestContext context) = 0;
   virtual void setServiceType(AudioServiceType serviceType, ReporterID reportingSession,
-                              BoolReply reply) = 0;
+                              BoolReply reply, RequestContext context) = 0;
   // Replies with the service type, not a name, and calls the reply twice for ID 0. Clients rely on
   // both.
-  virtual void getServiceNameForReporterID(ReporterID reporterID, ServiceTypeReply reply) = 0;
+  virtual void getServiceNameForReporterID(ReporterID reporterID, ServiceTypeReply reply,
+                                           RequestContext context) = 0;
   // Adds entries to the configuration of one of the client's own sessions.
   virtual void setConfiguration(platform::Dictionary configuration, ReporterID reporterID,
-                                BoolReply reply) = 0;
+                                BoolReply reply, RequestContext context) = 0;
   // Starts one of the client's own sessions. Replies when the session is stopped or started again,
   // which tells the client that the whole run is complete. If the session is destroyed instead, or
   // its connection ends, the reply is never called.
-  virtual void startReportingSessionForID(ReporterID reporterID, BoolReply reply) = 0;
+  virtual void startReportingSessionForID(ReporterID reporterID, BoolReply reply,
+                                          RequestContext context) = 0;
   // Passes a message to the back-ends and to the named sessions, which may belong to any client.
   // Without names, passes it to all active sessions.
   virtual void sendMessage(platform::Message message, AudioEventCategory category,
-                           AudioEventType type, ReporterIDs reporterIDs, ErrorReply reply) = 0;
-  virtual void stopReportingSessionForID(ReporterID reporterID, BoolReply reply) = 0;
-  virtual void destroyReportingSession(ReporterID reporterID, BoolReply reply) = 0;
+                           AudioEventType type, ReporterIDs reporterIDs, ErrorReply reply,
+                           RequestContext context) = 0;
+  virtual void stopReportingSessionForID(ReporterID reporterID, BoolReply reply,
+                                         RequestContext context) = 0;
+  virtual void destroyReportingSession(ReporterID reporterID, BoolReply reply,
+                                       RequestContext context) = 0;
   // Replies with "reporterID" and "serviceType" of a session; 0 and 65535 if there is none.
-  virtual void reporterIDValid(ReporterID reporterID, DictionaryReply reply) = 0;
+  virtual void reporterIDValid(ReporterID reporterID, DictionaryReply reply,
+                               RequestContext context) = 0;
   // Replies with the IDs of all sessions of all clients.
-  virtual void getAllReporters(ReportersReply reply) = 0;
+  virtual void getAllReporters(ReportersReply reply, RequestContext context) = 0;
   // Ends the process at once with exit status 2. Never replies, and stops or flushes no session.
   // Connections deliver it only from root and the service's own user.
   virtual void killService(BoolReply reply) = 0;

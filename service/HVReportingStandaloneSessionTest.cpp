@@ -30,7 +30,7 @@ class HVReportingStandaloneSessionTest : public DelegateFixture<KeepingDelegate>
   void sendToNobody(const platform::Message& message = Dictionary{{"a", 1}},
                     AudioEventType type = AudioEventType::kStart) {
     client_->sendMessage(message, AudioEventCategory::kPlayback, type, std::nullopt,
-                         [](const auto& /*error*/) {});
+                         [](const auto& /*error*/) {}, {});
     run();
   }
 };

@@ -7,27 +7,6 @@
 namespace halvox::platform {
 namespace {
 
-// The connection and request that are being delivered on this thread.
-thread_local const NSXPCConnection* deliveringConnection = nullptr;
-thread_local RequestToken deliveringRequest;
-
-class DeliveryMark {
- public:
-  DeliveryMark(const NSXPCConnection& connection, RequestToken request)
-      : outerConnection_(std::exchange(deliveringConnection, &connection)),
-        outerRequest_(std::exchange(deliveringRequest, std::move(request))) {}
-  DeliveryMark(const DeliveryMark&) = delete;
-  DeliveryMark& operator=(const DeliveryMark&) = delete;
-  ~DeliveryMark() {
-    deliveringConnection = outerConnection_;
-    deliveringRequest = std::move(outerRequest_);
-  }
-
- private:
-  const NSXPCConnection* outerConnection_;
-  RequestToken outerRequest_;
-};
-
 // Skips one complete type of a D-Bus signature. Returns the position after it.
 std::size_t skipType(std::string_view signature, std::size_t position) {
   if (signature.at(position) == 'a') return skipType(signature, position + 1);
@@ -99,21 +78,21 @@ std::shared_ptr<FakeCall> FakeConnection::call(std::string_view method,
               Value());
     return call;
   }
-  const DeliveryMark mark(*this, std::make_shared<std::shared_ptr<int>>(openRequests_));
-  target.invoke(*object, {arguments, [call](const std::optional<Error>& error, const Value& value) {
-                            call->add(error, value);
-                          }});
+  target.invoke(*object,
+                {.arguments = arguments,
+                 .reply = [call](const std::optional<Error>& error,
+                                 const Value& value) { call->add(error, value); },
+                 .context = {.sender = pid_,
+                             .token = std::make_shared<std::shared_ptr<int>>(openRequests_)}});
   return call;
 }
 
 void FakeConnection::interrupt() {
-  const DeliveryMark mark(*this, nullptr);
   if (!ended_ && interruptionHandler_) interruptionHandler_();
 }
 
 void FakeConnection::invalidate() {
   if (std::exchange(ended_, true)) return;
-  const DeliveryMark mark(*this, nullptr);
   if (invalidationHandler_) invalidationHandler_();
   abandon();
 }
@@ -158,11 +137,5 @@ void FakeConnectionService::clear() {
   for (const std::shared_ptr<FakeConnection>& connection : connections_) connection->abandon();
   connections_.clear();
 }
-
-const NSXPCConnection* FakeConnectionService::currentConnection() const {
-  return deliveringConnection;
-}
-
-RequestToken FakeConnectionService::currentRequest() const { return deliveringRequest; }
 
 }  // namespace halvox::platform

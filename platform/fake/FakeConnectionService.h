@@ -125,8 +125,6 @@ class FakeConnectionService final : public ConnectionService {
   void clear();
 
   [[nodiscard]] FakeListener& serviceListener() override { return listener_; }
-  [[nodiscard]] const NSXPCConnection* currentConnection() const override;
-  [[nodiscard]] RequestToken currentRequest() const override;
 
  private:
   Journal& journal_;

@@ -29,22 +29,18 @@ struct ContractAnswer {
 // One request as the object received it.
 struct SeenRequest {
   std::string text;
-  ProcessID currentProcess = 0;  // 0: no connection was current
+  ProcessID sender = 0;
   RequestToken token;
 };
 
 // The object that the suite exports. Any thread may call.
 class ContractObject final : public ExportedObject {
  public:
-  // Does not own the service, which must outlive it.
-  explicit ContractObject(const ConnectionService& service) : service_(service) {}
-
   void see(const Invocation& request) {
-    const NSXPCConnection* connection = service_.currentConnection();
     const std::lock_guard held(mutex_);
     seen_.push_back({.text = std::string(request.arguments[0].string()),
-                     .currentProcess = connection == nullptr ? 0 : connection->processIdentifier(),
-                     .token = service_.currentRequest()});
+                     .sender = request.context.sender,
+                     .token = request.context.token});
   }
   void keep(ReplyCallback reply) {
     const std::lock_guard held(mutex_);
@@ -69,7 +65,6 @@ class ContractObject final : public ExportedObject {
   }
 
  private:
-  const ConnectionService& service_;
   mutable std::mutex mutex_;
   std::vector<SeenRequest> seen_;
   ReplyCallback kept_;
@@ -105,11 +100,9 @@ inline const NSXPCInterface& contractInterface() {
 // Exports a new object for each client, and notes the events of connections.
 class ContractDelegate final : public NSXPCListenerDelegate {
  public:
-  explicit ContractDelegate(const ConnectionService& service) : service_(service) {}
-
   bool listenerShouldAcceptNewConnection(
       const std::shared_ptr<NSXPCConnection>& connection) override {
-    auto object = std::make_shared<ContractObject>(service_);
+    auto object = std::make_shared<ContractObject>();
     connection->setExportedInterface(contractInterface());
     connection->setExportedObject(object);
     connection->setInterruptionHandler([this] { note("interrupted"); });
@@ -143,13 +136,10 @@ class ContractDelegate final : public NSXPCListenerDelegate {
 
  private:
   void note(const char* event) {
-    const bool isCurrent = service_.currentConnection() != nullptr;
-    const bool isRequest = service_.currentRequest() != nullptr;
     const std::lock_guard held(mutex_);
-    events_.push_back(std::string(event) + (isCurrent && !isRequest ? "" : ", wrongly marked"));
+    events_.emplace_back(event);
   }
 
-  const ConnectionService& service_;
   mutable std::mutex mutex_;
   bool refuses_ = false;
   std::vector<std::string> events_;
@@ -160,7 +150,6 @@ class ContractDelegate final : public NSXPCListenerDelegate {
 // What every ConnectionService promises.
 //
 // `Harness` is default-constructible and has
-//   ConnectionService& service();
 //   void serve(NSXPCListenerDelegate& delegate);  called once, before the first client
 //   void end();  ends serving; nothing calls the delegate's objects afterwards
 //   bool canBe(ContractUser user);  whether the test can act as that user
@@ -185,7 +174,7 @@ class ConnectionContract : public ::testing::Test {
   }
 
   Harness harness_;
-  ContractDelegate delegate_{harness_.service()};
+  ContractDelegate delegate_;
 };
 TYPED_TEST_SUITE_P(ConnectionContract);
 
@@ -230,7 +219,7 @@ TYPED_TEST_P(ConnectionContract, RequestsOfAClientComeInTheirOrder) {
   }
 }
 
-TYPED_TEST_P(ConnectionContract, ConnectionAndRequestAreCurrentDuringADeliveryOnly) {
+TYPED_TEST_P(ConnectionContract, RequestNamesItsSenderAndHasATokenOfItsOwn) {
   auto client = this->connect();
   this->call(client, "echo", "a");
   this->call(client, "echo", "b");
@@ -239,12 +228,10 @@ TYPED_TEST_P(ConnectionContract, ConnectionAndRequestAreCurrentDuringADeliveryOn
 
   ASSERT_EQ(seen.size(), 2U);
   for (const SeenRequest& request : seen) {
-    EXPECT_EQ(request.currentProcess, client.process());
+    EXPECT_EQ(request.sender, client.process());
     EXPECT_NE(request.token, nullptr);
   }
   EXPECT_NE(seen[0].token, seen[1].token) << "each request has a token of its own";
-  EXPECT_EQ(this->harness_.service().currentConnection(), nullptr);
-  EXPECT_EQ(this->harness_.service().currentRequest(), nullptr);
 }
 
 TYPED_TEST_P(ConnectionContract, LateAnswerOfAnotherThreadReachesTheClient) {
@@ -331,7 +318,7 @@ TYPED_TEST_P(ConnectionContract, RequestForTheOwnerIsRefusedToOthersAndNotDelive
 REGISTER_TYPED_TEST_SUITE_P(
     ConnectionContract, DelegateIsAskedOnceForEachClientWhoseProcessIsKnown,
     RequestReachesTheObjectAndItsAnswerTheClient, ErrorReachesTheClientUnderItsName,
-    RequestsOfAClientComeInTheirOrder, ConnectionAndRequestAreCurrentDuringADeliveryOnly,
+    RequestsOfAClientComeInTheirOrder, RequestNamesItsSenderAndHasATokenOfItsOwn,
     LateAnswerOfAnotherThreadReachesTheClient, AnswerToAClientThatHasGoneDoesNothing,
     ClientThatVanishesIsInterruptedThenInvalidated, ObjectIsHeldUntilItsConnectionHasEnded,
     RefusedConnectionLetsGoOfItsObjectAndCallsNoHandler, RequestForTheOwnerIsDeliveredFromTheOwner,

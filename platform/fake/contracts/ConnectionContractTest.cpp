@@ -39,7 +39,6 @@ class FakeHarness {
     std::deque<std::shared_ptr<FakeCall>> calls_;
   };
 
-  ConnectionService& service() { return service_; }
   void serve(NSXPCListenerDelegate& delegate) { service_.serviceListener().setDelegate(delegate); }
   void end() { service_.clear(); }
   [[nodiscard]] bool canBe(ContractUser /*user*/) const { return true; }

@@ -6,7 +6,6 @@
 
 #include "platform/linux/connection/ConnectionHost.h"
 #include "platform/linux/connection/ConnectionLog.h"
-#include "platform/linux/connection/CurrentDelivery.h"
 #include "platform/linux/connection/ErrorNames.h"
 #include "platform/linux/connection/wire/FrameWriter.h"
 
@@ -158,11 +157,8 @@ void ClientConnection::end(Why why) {
 }
 
 void ClientConnection::finish() {
-  {
-    const CurrentDelivery current(*this, nullptr);
-    if (why_ == Why::kPeerVanished && interruptionHandler_) interruptionHandler_();
-    if (invalidationHandler_) invalidationHandler_();
-  }
+  if (why_ == Why::kPeerVanished && interruptionHandler_) interruptionHandler_();
+  if (invalidationHandler_) invalidationHandler_();
   if (unloggedRefusals_ > 0) {
     kLog.notice("refused ", unloggedRefusals_, " more requests of ", description());
   }

@@ -90,7 +90,6 @@ class LinuxHarness {
   LinuxHarness(const LinuxHarness&) = delete;
   LinuxHarness& operator=(const LinuxHarness&) = delete;
 
-  ConnectionService& service() { return *service_; }
   void serve(NSXPCListenerDelegate& delegate) {
     if (const auto error = service_->open()) throw std::runtime_error(error->description);
     service_->serviceListener().setDelegate(delegate);

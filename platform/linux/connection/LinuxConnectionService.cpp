@@ -3,7 +3,6 @@
 #include <utility>
 
 #include "platform/linux/connection/ConnectionHost.h"
-#include "platform/linux/connection/CurrentDelivery.h"
 
 namespace halvox::platform::linux_ {
 
@@ -16,12 +15,6 @@ LinuxConnectionService::~LinuxConnectionService() = default;
 std::optional<ConnectionOpenError> LinuxConnectionService::open() { return host_->open(); }
 
 NSXPCListener& LinuxConnectionService::serviceListener() { return *host_; }
-
-const NSXPCConnection* LinuxConnectionService::currentConnection() const {
-  return CurrentDelivery::connection();
-}
-
-RequestToken LinuxConnectionService::currentRequest() const { return CurrentDelivery::request(); }
 
 void LinuxConnectionService::requestStop() { host_->requestStop(); }
 

@@ -102,8 +102,6 @@ class LinuxConnectionService final : public ConnectionService {
   [[nodiscard]] std::optional<ConnectionOpenError> open();
 
   NSXPCListener& serviceListener() override;
-  [[nodiscard]] const NSXPCConnection* currentConnection() const override;
-  [[nodiscard]] RequestToken currentRequest() const override;
 
   // Lets resume() return at the end of its turn. Any thread.
   void requestStop();

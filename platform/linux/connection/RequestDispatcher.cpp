@@ -7,7 +7,6 @@
 #include <unistd.h>
 
 #include "platform/linux/connection/ClientConnection.h"
-#include "platform/linux/connection/CurrentDelivery.h"
 #include "platform/linux/connection/ErrorNames.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
 #include "platform/linux/connection/wire/ValueDecoder.h"
@@ -101,13 +100,12 @@ void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& m
   statistics_.requestsDelivered.add();
   ClientConnection& client = request.client;
   const FlowControl::Cost cost{.requests = weightOf(method), .bytes = request.frameBytes};
-  const RequestToken token = std::make_shared<OpenRequest>(client.link(), cost);
-  ReplyCallback reply = makeReply(client, request.header(), method);
-  {
-    const CurrentDelivery current(client, &token);
-    method.invoke(*client.exportedObject(),
-                  Invocation{.arguments = arguments_, .reply = std::move(reply)});
-  }
+  method.invoke(
+      *client.exportedObject(),
+      Invocation{.arguments = arguments_,
+                 .reply = makeReply(client, request.header(), method),
+                 .context = {.sender = client.processIdentifier(),
+                             .token = std::make_shared<OpenRequest>(client.link(), cost)}});
   arguments_.clear();
 }
 

@@ -12,7 +12,6 @@ ServiceUnderTest::ServiceUnderTest(const std::function<void(ConnectionOptions&)>
   if (configure) configure(options);
   service_.emplace(std::move(options), backpressure);
   if (const auto error = service_->open()) throw std::runtime_error(error->description);
-  setTestConnectionService(&*service_);
   service_->serviceListener().setDelegate(delegate);
   thread_ = std::jthread([this] { service_->serviceListener().resume(); });
 }

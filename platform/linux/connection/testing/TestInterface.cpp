@@ -10,8 +10,6 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-std::atomic<const ConnectionService*> currentService{nullptr};
-
 TestObject& objectOf(ExportedObject& object) {
   auto& test = static_cast<TestObject&>(object);
   ++test.delivered;
@@ -51,8 +49,7 @@ void hold(ExportedObject& object, Invocation&& invocation) {
 }
 
 void busy(ExportedObject& object, Invocation&& invocation) {
-  const ConnectionService* service = currentService;
-  objectOf(object).keepBusy(service->currentRequest(), std::move(invocation.reply));
+  objectOf(object).keepBusy(std::move(invocation.context.token), std::move(invocation.reply));
 }
 
 void answerTrue(ExportedObject& object, Invocation&& invocation) {
@@ -73,10 +70,8 @@ void list(ExportedObject& object, Invocation&& invocation) {
 
 void pid(ExportedObject& object, Invocation&& invocation) {
   objectOf(object);
-  const ConnectionService* service = currentService;
-  const NSXPCConnection* connection = service->currentConnection();
-  const bool isCurrent = connection != nullptr && service->currentRequest() != nullptr;
-  invocation.reply(std::nullopt, isCurrent ? connection->processIdentifier() : 0);
+  const RequestContext& context = invocation.context;
+  invocation.reply(std::nullopt, context.token != nullptr ? context.sender : 0);
 }
 
 constexpr MethodEffect kMore = MethodEffect::kMayHoldMore;
@@ -158,7 +153,5 @@ void TestDelegate::note(const std::string& event) {
   const MutexLock lock(mutex_);
   events_.push_back(event);
 }
-
-void setTestConnectionService(const ConnectionService* service) { currentService = service; }
 
 }  // namespace halvox::platform::linux_

@@ -51,7 +51,7 @@ class TestObject final : public ExportedObject {
 //   name ax → b       true; the numbers are reporter IDs
 //   list → ax         1000 numbers
 //   end → b           true; for the owner only
-//   pid → u           the process that asks; 0 when no connection or request is current
+//   pid → u           the process that asks; 0 for a request without a token
 const NSXPCInterface& testInterface();
 inline constexpr const char* kTestPath = "/com/tarno/test/object";
 inline constexpr const char* kTestInterface = "com.tarno.test.Object";
@@ -75,8 +75,5 @@ class TestDelegate final : public NSXPCListenerDelegate {
   mutable Mutex mutex_;
   std::vector<std::string> events_ HALVOX_GUARDED_BY(mutex_);
 };
-
-// The service whose currentConnection() and currentRequest() the methods ask.
-void setTestConnectionService(const ConnectionService* service);
 
 }  // namespace halvox::platform::linux_

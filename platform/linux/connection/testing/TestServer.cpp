@@ -30,7 +30,6 @@ int main(int argc, char** argv) {
     constexpr int kFirstStatus = 10;
     return kFirstStatus + static_cast<int>(error->kind);
   }
-  setTestConnectionService(&service);
   service.serviceListener().setDelegate(delegate);
   service.serviceListener().resume();
   return EXIT_SUCCESS;
