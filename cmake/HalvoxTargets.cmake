@@ -51,6 +51,17 @@ target_precompile_headers(halvox_precompiled_test PRIVATE
   ${halvox_common_headers} <gmock/gmock.h> <gtest/gtest.h>)
 target_link_libraries(halvox_precompiled_test PRIVATE halvox_flags GTest::gmock)
 
+# With the preset `tidy`, clang-tidy reads each source that is compiled. Tests and their helpers, fakes
+# and benchmarks go without, as in scripts/check.
+option(HALVOX_TIDY "Run clang-tidy on each source that is compiled (clang only)" OFF)
+function(halvox_tidy name)
+  file(RELATIVE_PATH folder ${CMAKE_SOURCE_DIR} ${CMAKE_CURRENT_SOURCE_DIR})
+  if(HALVOX_TIDY AND NOT "${folder}/" MATCHES "^(bench|tests|platform/fake)/|testing/"
+      AND NOT name MATCHES "_(testing|test_service|test_server)$")
+    set_target_properties(${name} PROPERTIES CXX_CLANG_TIDY "clang-tidy;--quiet")
+  endif()
+endfunction()
+
 # halvox_library(<name> SOURCES <files> [DEPENDS <targets>])
 function(halvox_library name)
   cmake_parse_arguments(ARG "" "" "SOURCES;DEPENDS" ${ARGN})
@@ -58,6 +69,7 @@ function(halvox_library name)
   target_link_libraries(${name} PUBLIC ${ARG_DEPENDS} PRIVATE halvox_flags)
   target_include_directories(${name} PUBLIC ${CMAKE_SOURCE_DIR})
   target_precompile_headers(${name} REUSE_FROM halvox_precompiled)
+  halvox_tidy(${name})
 endfunction()
 
 # halvox_program(<name> SOURCES <files> [DEPENDS <targets>])
@@ -65,6 +77,7 @@ function(halvox_program name)
   cmake_parse_arguments(ARG "" "" "SOURCES;DEPENDS" ${ARGN})
   add_executable(${name} ${ARG_SOURCES})
   target_link_libraries(${name} PRIVATE ${ARG_DEPENDS} halvox_flags)
+  halvox_tidy(${name})
 endfunction()
 
 # The tests that ThreadSanitizer runs too.
