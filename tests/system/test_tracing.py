@@ -1,6 +1,6 @@
-"""Traces of a real service by a real LTTng, in scratch directories of their own.
+"""Traces of a real service with a real LTTng, in scratch directories.
 
-This module gives up being root for good; see isolation.py.
+This module gives up being root for the rest of the process; see isolation.py.
 """
 
 import json
@@ -42,7 +42,8 @@ class KernelTraceTest(unittest.TestCase):
                 self.assertGreaterEqual(min(excess), 0)
                 self.assertLess(statistics.median(excess), 50_000)
 
-            # All threads used these codes at once, and each was matched with itself.
+            # All threads used these codes at the same time, and each begin was matched with the end
+            # of its thread.
             everything = sorted(value for own in measured["own"] for value in own)
             shared = sorted(values["Shared"])
             self.assertEqual(len(shared), THREADS * PAIRS)
@@ -66,7 +67,8 @@ class KernelTraceTest(unittest.TestCase):
                 service.run_client("intervals", 10)
             values = wait_for_results(service)["values"]
 
-            # The first and the last code are, and those beside them are not even read back.
+            # The first and the last code are recorded. The codes beside them are not even read
+            # back.
             self.assertEqual(len(values["Edges"]), THREADS * 10)
             self.assertNotIn("Outside", values)
             # Two each of the shared codes, the own codes and the edges, and two across threads.
@@ -90,7 +92,7 @@ class KernelTraceTest(unittest.TestCase):
             self.assertFalse(service.note.exists())
 
     def test_events_that_find_no_room_are_counted_and_told(self):
-        events = 600_000  # of which a processor's buffers hold about a third
+        events = 600_000  # the buffers of a processor have room for about a third of them
         processor = min(os.sched_getaffinity(0))
         with TracedService() as service:
             with traced_session(service):
@@ -123,7 +125,8 @@ class KernelTraceTest(unittest.TestCase):
             self.assertGreater(lost, 0)
             self.assertEqual(lost + delivered, events)
             self.assertEqual(len(values["Shared"]), delivered // 2)
-            self.assertIn(f"kernel trace lost {lost} events and 0 packets", service.log())
+            self.assertIn(f"no room for {lost} events and 0 packets of a kernel trace",
+                          service.log())
 
     def test_service_that_was_killed_is_cleaned_up_after(self):
         with TracedService() as service:
@@ -202,7 +205,7 @@ class KernelTraceTest(unittest.TestCase):
             handled = sum(int(counts.get(name, 0)) for name in
                           ("events delivered", "events dropped: the service ends"))
             self.assertEqual(handled, read)
-            # Otherwise the end of the service would take as long as the reading of its traces.
+            # Otherwise the end of the service would take as long as reading its traces.
             self.assertLess(read + int(counts.get("events lost by the tracer", 0)), events)
 
     def test_without_the_feature_nothing_is_traced(self):
@@ -220,13 +223,13 @@ class KernelTraceTest(unittest.TestCase):
                 os.kill(daemon, signal.SIGKILL)
                 wait_for("its end", lambda: not is_running(daemon))
             self.assertEqual(wait_for_results(service)["values"], {})
-            self.assertIn("kernel trace incomplete: ", service.log())
+            self.assertIn("cannot end a kernel trace: ", service.log())
 
             with traced_session(service):
                 self.assertNotEqual(service.daemon(), daemon)
                 service.run_client("intervals", 1)
             wait_for("the new results", lambda: "Own0" in service.results()["values"])
-            # Nobody has to wait for the first one any more.
+            # Nobody needs to wait for the first one any more.
             self.assertFalse(Path(f"/proc/{daemon}").exists())
 
     def test_million_events_are_read_back_without_loss(self):
@@ -238,7 +241,7 @@ class KernelTraceTest(unittest.TestCase):
                 waited_before = waits_for_processor(service.process.pid)
             values = wait_for_results(service)["values"]
             elapsed = os.times().elapsed - begin
-            # Of a busy machine, the thread that was kept waiting most did so much longer.
+            # On a busy machine, the thread that waited longest waited much longer than the others.
             waits = waits_for_processor(service.process.pid)
             waited = max(waits[thread] - waited_before.get(thread, 0) for thread in waits)
             peak = next(int(line.split()[1]) for line in
@@ -248,7 +251,7 @@ class KernelTraceTest(unittest.TestCase):
             print(f"{events} events in {took:.1f} s, read back in {elapsed:.1f} s of which "
                   f"{waited:.1f} s without a processor, {peak / 1024:.0f} MiB at most", flush=True)
             self.assertEqual(len(values["Shared"]), events // 2, service.log()[-2000:])
-            # A sanitized build is slower, and keeps freed memory for a while.
+            # A sanitized build is slower and keeps freed memory for a while.
             if not os.environ.get("HALVOX_SANITIZE"):
                 self.assertLess(elapsed - waited, 10)
                 self.assertLess(peak / 1024, 300)
@@ -271,7 +274,7 @@ class KernelTraceTest(unittest.TestCase):
 
 
 class ForgottenTraceTest(unittest.TestCase):
-    """Traces that no stop ends, because the session has become another's kind meanwhile."""
+    """Traces that no stop ends, because the session has another service type by then."""
 
     def assert_nothing_records_once_released(self, service, client):
         self.assertIn("halvox-", service.sessions())
@@ -343,14 +346,14 @@ class ToolTest(unittest.TestCase):
             self.assertIn("false ended with status 1", done.stderr)
 
     def assert_only_failures(self, output):
-        """With --json each failure is an object; there is no result beside them."""
+        """With --json each failure is an object, and there is no result besides it."""
         objects = [json.loads(line) for line in output.splitlines()]
         self.assertGreater(len(objects), 0)
         self.assertEqual({(each["command"], each["result"]) for each in objects},
                          {("trace record", False)})
 
     def assert_refused(self, service, *reasons):
-        """Of the parameters file, before the program runs."""
+        """Mistakes in the parameters file are reported before the program runs."""
         mark = service.directory / "ran"
         done = self.record(service, "touch", mark)
         self.assertNotEqual(done.returncode, 0)
@@ -442,7 +445,7 @@ class PerformanceTraceTest(unittest.TestCase):
             self.assertFalse(service.scratch())
 
     def completion_of_failed_trace(self, spoil):
-        """The line of the one completion of a trace that something happens to while it runs."""
+        """The log line of the only completion of a trace that is disturbed while it runs."""
         with TracedService() as service:
             client = start_session(service, trace_type=None)
             wait_for("its start", lambda: "Performance Trace Started" in service.log())

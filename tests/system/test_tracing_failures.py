@@ -1,6 +1,6 @@
-"""What becomes of traces when there is no tracer, and of results that cannot be written.
+"""What happens to traces without a tracer, and to results that cannot be written.
 
-No LTTng is needed, and none is met: the service finds the programs of the test alone.
+LTTng is not needed and not used: the service finds only the programs of the test.
 """
 
 import unittest
@@ -32,7 +32,7 @@ class NoTracerTest(unittest.TestCase):
 
             self.assert_measures_nothing(service)
             if service.has_tracer():
-                self.assertIn("no kernel trace: cannot start lttng-sessiond: "
+                self.assertIn("cannot start a kernel trace: cannot start lttng-sessiond: "
                               "No such file or directory", service.log())
                 self.assertEqual(service.counted("traces that failed"), 1)
 
@@ -47,7 +47,8 @@ class NoTracerTest(unittest.TestCase):
                 pass
 
             self.assert_measures_nothing(service)
-            self.assertIn("no kernel trace: lttng-sessiond ended at once", service.log())
+            self.assertIn("cannot start a kernel trace: lttng-sessiond ended at once",
+                          service.log())
 
     def test_performance_trace_reports_a_failed_start_and_does_not_hold_the_service(self):
         with TracedService() as service:
@@ -59,7 +60,7 @@ class NoTracerTest(unittest.TestCase):
             self.assertIn("started performance trace.", service.log())
             self.assertNotIn("Performance Trace Started", service.log())
 
-            # This stop waits for a completion that never comes; the service ends all the same.
+            # This stop waits for a completion that never comes. The service ends all the same.
             stop = client.call_later("stopReportingSessionForID", "x", REPORTER)
             wait_for("the stop to be carried out",
                      lambda: f"ending session {REPORTER}" in service.log())
@@ -72,7 +73,7 @@ class NoTracerTest(unittest.TestCase):
 
 
 class TypeChangedTest(unittest.TestCase):
-    """The type of trace changes between a start and its stop, which chooses by the new one."""
+    """The trace type changes between a start and its stop. The stop uses the new one."""
 
     def test_runner_that_has_finished_is_not_stopped_again(self):
         with TracedService() as service:

@@ -30,20 +30,21 @@ void writeText(TextWriter& json, std::string_view text) {
   json.String(valid.data(), static_cast<rapidjson::SizeType>(valid.size()));
 }
 
-// The directory and the name of a path.
+// Splits a path into its directory and its name.
 std::pair<std::string_view, std::string> split(std::string_view path) {
   const std::size_t slash = path.rfind('/');
   if (slash == std::string_view::npos) return {"/", std::string(path)};
   return {path.substr(0, slash + 1), std::string(path.substr(slash + 1))};
 }
 
-// Keeps the values until the file is finished: those of one name stand together in it.
+// Keeps the values in memory until the file is finished, because the values of a name are together
+// in the file but do not come together.
 class ResultsFile final : public Sswriter {
  public:
   ResultsFile(std::string_view product, std::uint32_t version)
       : product_(product), version_(version) {}
 
-  // 0 or the system's error.
+  // Creates the unfinished file, so that a directory that cannot be written fails at the start.
   [[nodiscard]] std::optional<Error> begin(const RootedDirectory::Place& place, std::string name) {
     name_ = std::move(name);
     path_ = place.text() + (place.path.ends_with('/') ? "" : "/") + name_;
@@ -98,7 +99,7 @@ class ResultsFile final : public Sswriter {
   std::string name_;
   std::string path_;
   UnfinishedFile file_;
-  std::map<std::string, std::size_t, std::less<>> places_;
+  std::map<std::string, std::size_t, std::less<>> places_;  // positions in `values_`
   std::vector<std::pair<std::string, std::vector<double>>> values_;
 };
 
@@ -122,7 +123,7 @@ ResultsFileService::Writer JsonResultsFileService::sswriter_open(std::string_vie
   const auto error = file->begin({root_, directory}, std::move(name));
   if (!error.has_value()) return file;
   failed_.add();
-  kLog.error("no results: ", error->description);
+  kLog.error("cannot write a results file: ", error->description, "; its values are lost");
   return nullptr;
 }
 
@@ -136,7 +137,9 @@ void JsonResultsFileService::sswriter_close(Writer writer) {
   if (writer == nullptr) return;
   const auto error = dynamic_cast<ResultsFile&>(*writer).finish();
   (error.has_value() ? failed_ : written_).add();
-  if (error.has_value()) kLog.error("no results: ", error->description);
+  if (error.has_value()) {
+    kLog.error("cannot write a results file: ", error->description, "; its values are lost");
+  }
 }
 
 }  // namespace halvox::platform::linux_

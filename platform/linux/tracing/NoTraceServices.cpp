@@ -20,13 +20,14 @@ struct NoSession final : KtraceSession {
 };
 using State = NoSession::State;
 
-// The session in that state; null when it is in another or there is none.
+// The session if it is in that state; null otherwise.
 std::shared_ptr<NoSession> own(const KtraceService::Session& session, State state) {
   auto ours = std::dynamic_pointer_cast<NoSession>(session);
   return ours != nullptr && ours->state == state ? ours : nullptr;
 }
 
-// Sessions that cannot be started, and complete when they are ended.
+// Kernel traces that cannot be started. They follow the states of the port all the same: an end
+// completes them, because the session's stop waits for the completion.
 class NoKtraceService final : public KtraceService {
  public:
   Session ktrace_session_create() override { return std::make_shared<NoSession>(); }
@@ -51,7 +52,7 @@ class NoKtraceService final : public KtraceService {
     if (ours == nullptr) return;
     ours->state = State::kEnded;
     ours->queue->async(JobWeight::kMayBlock, [ours] {
-      // Taken out: the handler may destroy the session, which lets go of it.
+      // Moved out first: the handler may destroy the session, which releases the handler.
       if (const auto completion = std::exchange(ours->completion, nullptr)) completion();
     });
   }
@@ -67,6 +68,7 @@ class NoKtraceService final : public KtraceService {
   }
 };
 
+// Reports from its queue that it cannot start, because a delegate is never called inside a call.
 class NoTraceSession final : public KQTraceSession,
                              public std::enable_shared_from_this<NoTraceSession> {
  public:
@@ -107,7 +109,7 @@ class NoPerformanceTraceService final : public PerformanceTraceService {
       std::shared_ptr<KQTraceConfig> /*configuration*/) override {
     return std::make_shared<NoTraceSession>(queue());
   }
-  // Lets go of the queue; after the queues have ended.
+  // Releases the queue. Call it after the queues have ended.
   void close() {
     const MutexLock lock(mutex_);
     queue_.reset();
@@ -135,7 +137,9 @@ class NoTraceServices final : public TraceServices {
   void stop() override {}
   void close() override { performanceTraces_.close(); }
   void abandon() override {}
-  [[nodiscard]] std::string description() const override { return "none, LTTng not in this build"; }
+  [[nodiscard]] std::string description() const override {
+    return "none (LTTng is not in this build)";
+  }
 
  private:
   NoKtraceService ktrace_;

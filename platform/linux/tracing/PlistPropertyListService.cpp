@@ -33,7 +33,7 @@ Error parseError(std::string_view what) {
           .description = "the property list " + std::string(what)};
 }
 
-// Less than everything when there is an error.
+// Reads until the buffer is full or the file ends. Returns 0 or the system's error.
 int readAll(int descriptor, std::vector<std::byte>& bytes) {
   std::size_t filled = 0;
   while (filled < bytes.size()) {
@@ -53,7 +53,7 @@ Value integer(plist_t node) {
   std::uint64_t number = 0;
   plist_get_uint_val(node, &number);
   if (number <= INT64_MAX) return static_cast<std::int64_t>(number);
-  // The library keeps the sign to itself, but shows it.
+  // The library has no function for the sign, but prints it.
   OwnedText text;
   std::uint32_t length = 0;
   plist_to_xml(node, text.out(), &length);
@@ -64,7 +64,7 @@ Value integer(plist_t node) {
 }
 
 Value date(plist_t node) {
-  constexpr double kSecondsTo2001 = 978'307'200;  // where the dates of property lists start
+  constexpr double kSecondsTo2001 = 978'307'200;  // property lists count dates from 2001
   constexpr double kMicrosecond = 1e-6;
   std::int32_t seconds = 0;
   std::int32_t microseconds = 0;
@@ -165,13 +165,15 @@ std::optional<Data> PlistPropertyListService::readFile(std::string_view path,
     return std::nullopt;
   };
   if (name.find('\0') != std::string::npos) return fail(EINVAL);
+  // O_NONBLOCK: opening a pipe would wait for its writer. O_NOCTTY: a terminal must not become
+  // ours.
   const UniqueFd file(::open(name.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
   if (!file) return fail(errno);
   struct stat status {};
   if (::fstat(file.get(), &status) != 0) return fail(errno);
   if (S_ISDIR(status.st_mode)) return fail(EISDIR);
   if (!S_ISREG(status.st_mode)) return fail(EINVAL);
-  // One byte of room more shows a file that grew.
+  // The buffer has one byte more than the file, which shows a file that grows while it is read.
   const auto size = static_cast<std::uint64_t>(status.st_size);
   if (size > kMostFileBytes) return fail(EFBIG);
   std::vector<std::byte> bytes(static_cast<std::size_t>(size) + 1);
@@ -186,7 +188,7 @@ std::optional<Value> PlistPropertyListService::parse(const std::optional<Data>& 
     error = parseError(what);
     return std::nullopt;
   };
-  if (!bytes.has_value()) return fail("is not there");
+  if (!bytes.has_value()) return fail("is missing");
   const auto span = bytes->bytes();
   if (span.empty()) return fail("is empty");
   if (span.size() > kMostFileBytes) return fail("is too large");
@@ -199,10 +201,11 @@ std::optional<Value> PlistPropertyListService::parse(const std::optional<Data>& 
   } else {
     plist_from_xml(text.data(), length, list.out());
   }
-  if (!list) return fail("cannot be read: its form is neither XML nor binary");
+  if (!list) return fail("cannot be parsed: it is neither valid XML nor valid binary");
+  // Checked once more on the result: the shape is a guess at how the library reads the bytes.
   bool isTooDeep = false;
   Value root = convert(list.get(), kBounds.depth, isTooDeep);
-  if (isTooDeep) return fail("turned out to be nested too deeply");
+  if (isTooDeep) return fail("is nested too deeply");
   return root;
 }
 

@@ -20,7 +20,7 @@ class PlistPropertyListServiceTest : public testing::Test {
   static bool runs(const std::string& command) {
     return std::system((command + " >/dev/null 2>&1").c_str()) == 0;
   }
-  // Has Python write this value in that form.
+  // Lets Python write this value in that form.
   bool writeByPython(const std::string& name, const std::string& value, const std::string& form) {
     const std::filesystem::path script = scratch_ / "write.py";
     std::ofstream(script) << "import datetime, plistlib\n"
@@ -35,7 +35,7 @@ class PlistPropertyListServiceTest : public testing::Test {
   std::optional<Value> parse(std::string_view text) {
     return service_.parse(Data(std::as_bytes(std::span(text.data(), text.size()))), error_);
   }
-  // What is wrong with it; empty when nothing is.
+  // The error's text; empty if there is none.
   std::string failure(std::string_view text) {
     error_.reset();
     return parse(text).has_value() ? "" : error_.value_or(Error{}).description;
@@ -134,7 +134,7 @@ TEST_F(PlistPropertyListServiceTest, BytesThatAreNoListAreErrors) {
   EXPECT_EQ(failure(""), "the property list is empty");
   EXPECT_NE(failure("neither"), "");
   EXPECT_NE(failure("<plist><dict><key>a</key></plist>"), "");
-  EXPECT_EQ(failure("bplist00"), "the property list is no binary property list");
+  EXPECT_EQ(failure("bplist00"), "the property list is not a binary property list");
 }
 
 std::string nested(std::size_t levels) {
@@ -185,7 +185,7 @@ std::string doubling(unsigned char levels) {
 
 TEST_F(PlistPropertyListServiceTest, BinaryListsCannotGrowBySharing) {
   EXPECT_EQ(failure(doubling(10)), "");
-  EXPECT_EQ(failure(doubling(40)), "the property list has too many values");
+  EXPECT_EQ(failure(doubling(40)), "the property list has too many values or too much text");
 }
 
 TEST_F(PlistPropertyListServiceTest, BinaryListThatContainsItselfIsAnError) {

@@ -7,10 +7,10 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr const char* kTooDeep = "is nested too deeply";
-constexpr const char* kTooLarge = "has too many values";
-constexpr const char* kNotXml = "is no XML property list";
-constexpr const char* kHasNul = "has a text with a NUL";
-constexpr const char* kNotBinary = "is no binary property list";
+constexpr const char* kTooLarge = "has too many values or too much text";
+constexpr const char* kNotXml = "is not an XML property list";
+constexpr const char* kHasNul = "contains a text with a NUL byte";
+constexpr const char* kNotBinary = "is not a binary property list";
 
 using Reason = const char*;  // null: none
 
@@ -18,7 +18,7 @@ std::size_t quotesIn(std::string_view text) {
   return static_cast<std::size_t>(std::ranges::count(text, '"'));
 }
 
-// The library ends the process when a key has one.
+// The library ends the process by an assertion if a key contains a NUL.
 bool hasNul(std::string_view text, bool isUtf16) {
   if (!isUtf16) return text.find('\0') != std::string_view::npos;
   for (std::size_t at = 0; at + 1 < text.size(); at += 2) {
@@ -32,9 +32,12 @@ bool hasNulInXml(std::string_view text) {
          text.find("&#x0") != std::string_view::npos;
 }
 
-// Counts the tags of an XML list. Whatever the library might see differently is refused or counted
-// against the file: opening tags count in comments too, closing ones do not, quotes in tags must be
-// balanced and hold no bracket, and the document type must have no declarations of its own.
+// Counts the tags of an XML list and compares them with the bounds.
+//
+// This is not an XML parser, and must not be: it only has to count at least as much as the library
+// will. Whatever the library might read differently is refused or counted against the file. Opening
+// tags count in comments too, closing ones do not; quotes in tags must be balanced and contain no
+// bracket; the document type must not have declarations of its own.
 class XmlShape {
  public:
   XmlShape(std::string_view text, const PropertyListBounds& bounds)
@@ -51,7 +54,7 @@ class XmlShape {
  private:
   static constexpr Reason kMore = "";
 
-  // Goes behind the next piece of markup; null at the end.
+  // Moves past the next piece of markup. Null at the end, kMore if there is more to read.
   Reason step() {
     const std::size_t start = text_.find('<');
     if (start == std::string_view::npos) return nullptr;
@@ -99,7 +102,7 @@ class XmlShape {
     return kMore;
   }
 
-  // The element that holds the list.
+  // The <plist> element, which contains the list and counts as a level here.
   static constexpr std::size_t kLevelsAround = 1;
 
   std::string_view text_;
@@ -108,7 +111,9 @@ class XmlShape {
   std::uint64_t elements_ = 0;
 };
 
-// Weighs the objects of a binary list, each once, from the root down.
+// Computes the weight of a binary list: how large it becomes when every use of a shared object is a
+// copy. Each object is weighed once, from the root down, with a stack of its own instead of
+// recursion.
 class BinaryShape {
  public:
   BinaryShape(std::string_view bytes, const PropertyListBounds& bounds)
@@ -132,11 +137,11 @@ class BinaryShape {
     std::uint64_t elements = 1;
     std::uint64_t bytes = 0;
   };
-  // What an object is made of: payload, or references to others.
+  // The content of an object: payload bytes, or references to other objects.
   struct Object {
     std::uint64_t bytes = 0;
     std::uint64_t references = 0;
-    std::size_t first = 0;  // where they are
+    std::size_t first = 0;  // position of the first reference
   };
   struct Level {
     std::uint64_t object = 0;
@@ -144,6 +149,8 @@ class BinaryShape {
     Object content{};
   };
 
+  // The last 32 bytes describe the rest. Every number in them is from outside, so each is compared
+  // with the size of the file before it is used; the subtraction and the division cannot overflow.
   Reason readTrailer() {
     constexpr std::size_t kHeader = 8;
     constexpr std::size_t kTrailer = 32;
@@ -202,7 +209,7 @@ class BinaryShape {
     return isTooLarge ? kTooLarge : nullptr;
   }
 
-  // Fills in what an object is made of; what it is stays the library's to check.
+  // Fills in the content of an object. Whether the object itself is valid is left to the library.
   Reason read(std::uint64_t object, Object& content) const {
     enum : std::uint8_t { kData = 4, kAscii = 5, kUtf16 = 6, kArray = 10, kDictionary = 13 };
     std::size_t at = number(offsets_ + object * offsetSize_, offsetSize_);
@@ -215,6 +222,7 @@ class BinaryShape {
     }
     std::uint64_t count = marker & 0x0FU;
     if (count == 0x0F && !readCount(at, count)) return kNotBinary;
+    // Bounds the multiplications below: the count is at most the size of the file.
     if (count > bytes_.size()) return kNotBinary;
     const bool isContainer = kind == kArray || kind == kDictionary;
     const std::uint64_t parts = kind == kUtf16 || kind == kDictionary ? count * 2 : count;
@@ -227,7 +235,7 @@ class BinaryShape {
     return nullptr;
   }
 
-  // A count that did not fit into the marker: an integer of its own.
+  // A count of 15 or more is an integer after the marker.
   bool readCount(std::size_t& at, std::uint64_t& count) const {
     if (at >= bytes_.size()) return false;
     const auto marker = static_cast<unsigned char>(bytes_[at++]);
@@ -238,7 +246,7 @@ class BinaryShape {
     return true;
   }
 
-  // Most significant byte first. The caller has checked that it is there.
+  // Most significant byte first. The caller has checked that the bytes exist.
   [[nodiscard]] std::uint64_t number(std::size_t at, std::size_t size) const {
     std::uint64_t result = 0;
     for (const char byte : bytes_.substr(at, size)) {

@@ -23,13 +23,15 @@ using Channel = UniqueHandle<lttng_channel*, lttng_channel_destroy>;
 using Event = UniqueHandle<lttng_event*, lttng_event_destroy>;
 
 constexpr const char* kChannel = "halvox";
-// For each processor: holds 200,000 events a second for the second that the consumer may be late.
+// The buffers of one processor: 16 MiB hold 200,000 events a second for the second that the
+// consumer may be late.
 constexpr std::uint64_t kSubBufferBytes = 1U << 20U;
 constexpr std::uint64_t kMostSubBuffers = 16;
 constexpr std::uint64_t kFewestSubBuffers = 4;
 constexpr std::uint64_t kMostBytesOfAll = 256U << 20U;
 
-// The tracer takes memory for every processor that the machine may have.
+// The tracer allocates buffers for every processor that the machine may ever have. On large
+// machines each gets fewer, so that all of them together stay within 256 MiB.
 std::uint64_t subBuffers() {
   const auto processors = static_cast<std::uint64_t>(std::max(1L, ::sysconf(_SC_NPROCESSORS_CONF)));
   const std::uint64_t share = kMostBytesOfAll / kSubBufferBytes / processors;
@@ -39,11 +41,12 @@ std::uint64_t subBuffers() {
 lttng_domain domain() {
   lttng_domain result{};
   result.type = LTTNG_DOMAIN_UST;
+  // One set of buffers for each user, not for each process: processes come and go.
   result.buf_type = LTTNG_BUFFER_PER_UID;
   return result;
 }
 
-// `result` is one of the library's codes, negative for an error.
+// `result` is a code of the library; negative ones are errors.
 LttngControl::Failure check(int result, std::string_view what) {
   if (result >= 0) return std::nullopt;
   return "cannot " + std::string(what) + ": " + ::lttng_strerror(result);
@@ -58,8 +61,10 @@ void copyName(std::span<char> to, std::string_view from) {
 LttngControl::Failure addChannel(lttng_handle* handle) {
   lttng_domain ust = domain();
   const Channel channel(::lttng_channel_create(&ust));
-  if (!channel) return "cannot make a channel";
+  if (!channel) return "cannot create a channel";
   copyName(channel.get()->name, kChannel);
+  // When the buffers are full, new events are lost and counted. Overwriting old ones would lose the
+  // begins of intervals without a count.
   channel.get()->attr.overwrite = 0;
   channel.get()->attr.subbuf_size = kSubBufferBytes;
   channel.get()->attr.num_subbuf = subBuffers();
@@ -79,7 +84,7 @@ LttngControl::Failure addContexts(lttng_handle* handle) {
 
 LttngControl::Failure addEvent(lttng_handle* handle, RecordingPlan plan) {
   const Event event(::lttng_event_create());
-  if (!event) return "cannot make an event";
+  if (!event) return "cannot create an event";
   event.get()->type = LTTNG_EVENT_TRACEPOINT;
   event.get()->loglevel_type = LTTNG_EVENT_LOGLEVEL_ALL;
   copyName(event.get()->name, plan.event);
@@ -123,12 +128,12 @@ LttngControl::Failure LttngControl::begin(const RecordingPlan& plan, Recording& 
   recording.name = namePrefix() + std::to_string(::getpid()) + "-" + std::to_string(++begun_);
   recording.directory = scratchDirectory_ / recording.name;
   std::filesystem::create_directories(recording.directory, error);
-  if (error) return "cannot make " + recording.directory.string() + ": " + error.message();
+  if (error) return "cannot create " + recording.directory.string() + ": " + error.message();
   if (::lttng_session_daemon_alive() != 1) {
     if (auto failure = daemon_.start(namePrefix())) return failure;
   }
   if (auto failure = setUp(plan, recording)) return failure;
-  // For those who wait for it; the recording does without.
+  // For tests and tools that wait for it. The recording works without it, so errors are ignored.
   std::filesystem::create_directories(recordingDirectory_, error);
   std::ofstream(recordingDirectory_ / recording.name).close();
   return std::nullopt;
@@ -142,7 +147,7 @@ LttngControl::Failure LttngControl::setUp(const RecordingPlan& plan, const Recor
   }
   lttng_domain ust = domain();
   const Handle handle(::lttng_create_handle(name, &ust));
-  Failure failure = handle ? addChannel(handle.get()) : Failure("cannot make a handle");
+  Failure failure = handle ? addChannel(handle.get()) : Failure("cannot create a handle");
   if (!failure) failure = addContexts(handle.get());
   if (!failure) failure = addEvent(handle.get(), plan);
   if (!failure) failure = check(::lttng_start_tracing(name), "start the session");
@@ -155,7 +160,7 @@ LttngControl::Failure LttngControl::end(const Recording& recording) {
   std::error_code ignored;
   std::filesystem::remove(recordingDirectory_ / recording.name, ignored);
   const char* const name = recording.name.c_str();
-  // Both wait until what was recorded is on the disk.
+  // Both calls wait until the recording is on the disk. Both are made whatever the first returns.
   Failure failure = check(::lttng_stop_tracing(name), "stop the session");
   Failure other = check(::lttng_destroy_session(name), "destroy the session");
   return failure ? failure : other;

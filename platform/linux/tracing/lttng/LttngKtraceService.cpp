@@ -15,11 +15,13 @@ constexpr UnitLog kLog(tracingCategory, "LttngKtraceService");
 
 constexpr int kNotStarted = 1;
 constexpr int kNoRange = 2;
-constexpr int kUnsuitable = 3;  // there is no session, or it is not being set up any more
+constexpr int kUnsuitable = 3;  // no session, or not in the state for the call
+// A batch is one job of the queue. Large enough that the job costs little compared with its events,
+// and small enough that a few batches are some megabytes.
 constexpr std::size_t kBatchEvents = 4096;
 
-// Events on their way to the queue. They are counted as dropped when they go undelivered: the queue
-// has ended with the service.
+// Events on their way to the queue. If the queue has ended with the service, the batch is destroyed
+// undelivered and counts its events as dropped.
 class Batch {
  public:
   explicit Batch(Counter& dropped) : dropped_(dropped) {}
@@ -47,8 +49,9 @@ struct Range {
 
 }  // namespace
 
-// Belongs to who sets it up until it is started, and then to the queue that it was started with.
-// The thread that reads has the recording and the clock between the end and the deliveries.
+// One kernel trace. Belongs to the code that sets it up until it is started, and then to the queue
+// that it was started with. Between the end and the deliveries the reading thread uses the
+// recording and the clock; nobody else does then.
 class LttngKtraceSession final : public KtraceSession {
  public:
   enum class State : std::uint8_t { kMade, kStarted, kEnded, kDestroyed };
@@ -57,10 +60,12 @@ class LttngKtraceSession final : public KtraceSession {
   std::vector<Range> ranges;
   std::function<void()> completion;
   std::shared_ptr<DispatchQueue> queue;
-  std::optional<LttngControl::Recording> recording;  // while it records
+  std::optional<LttngControl::Recording> recording;  // set by a start that succeeded
   TraceClock clock;
   bool hasWalltimes = false;
 
+  // The ranges as an expression of LTTng. Filtering in the tracer keeps other codes out of the
+  // buffers.
   [[nodiscard]] std::string filter() const {
     std::string text;
     for (const Range& range : ranges) {
@@ -85,7 +90,7 @@ namespace {
 
 using State = LttngKtraceSession::State;
 
-// The session in that state; null when it is in another or there is none.
+// The session if it is in that state; null otherwise.
 std::shared_ptr<LttngKtraceSession> own(const KtraceService::Session& session, State state) {
   auto ours = std::dynamic_pointer_cast<LttngKtraceSession>(session);
   return ours != nullptr && ours->state == state ? ours : nullptr;
@@ -133,7 +138,7 @@ void LttngKtraceService::close() {
 std::shared_ptr<DispatchQueue> LttngKtraceService::readingQueue() {
   const MutexLock lock(mutex_);
   if (readingQueue_ == nullptr) {
-    // A stop waits for it on the reporting queue, so it must not run after what gives way.
+    // Not of a lower quality: a stop waits for it on the reporting queue.
     readingQueue_ = platform::dispatch().createSerialQueue(
         "Trace Reading", QualityOfService::kUserInteractive, QueueThreading::kOwnThread);
   }
@@ -168,13 +173,15 @@ int LttngKtraceService::ktrace_start(const Session& session, std::shared_ptr<Dis
   ours->state = State::kStarted;
   ours->queue = std::move(queue);
   started_.add();
+  // LTTng records every event if the filter is empty, so a session without ranges is not given to
+  // it.
   if (ours->ranges.empty()) return 0;
   LttngControl::Recording recording;
   const RecordingPlan plan{.event = "halvox:kdebug", .filter = ours->filter()};
   if (const auto failure = control_.begin(plan, recording)) {
     failed_.add();
     control_.discard(recording);
-    kLog.error("no kernel trace: ", *failure);
+    kLog.error("cannot start a kernel trace: ", *failure, "; nothing is recorded");
     return kNotStarted;
   }
   ours->recording = std::move(recording);
@@ -188,17 +195,19 @@ void LttngKtraceService::ktrace_end(const Session& session, int /*reason*/) {
   readingQueue()->async(JobWeight::kMayBlock, [this, ours = std::move(ours)] { finish(ours); });
 }
 
-// On the service's thread.
+// Runs on the service's thread.
 void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& session) {
   if (session->recording.has_value()) {
     const auto failure = control_.end(*session->recording);
-    if (failure) kLog.error("kernel trace incomplete: ", *failure);
+    if (failure) {
+      kLog.error("cannot end a kernel trace: ", *failure, "; delivering what was recorded");
+    }
     const bool isRead = deliverAll(session);
     if (failure || !isRead) failed_.add();
     control_.discard(*session->recording);
   }
   session->queue->async(JobWeight::kMayBlock, [session] {
-    // Taken out: the handler may destroy the session, which lets go of its handlers.
+    // Moved out first: the handler may destroy the session, which releases its handlers.
     if (const auto completion = std::exchange(session->completion, nullptr)) completion();
   });
 }
@@ -229,9 +238,13 @@ bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
   deliver();
   lost_.add(reading.lost);
   lostPackets_.add(reading.lostPackets);
-  if (reading.failure) kLog.error("kernel trace cannot be read back: ", *reading.failure);
+  if (reading.failure) {
+    kLog.error("cannot read a kernel trace back: ", *reading.failure,
+               "; its remaining events are lost");
+  }
   if (reading.lost + reading.lostPackets > 0) {
-    kLog.error("kernel trace lost ", reading.lost, " events and ", reading.lostPackets, " packets");
+    kLog.error("the tracer's buffers had no room for ", reading.lost, " events and ",
+               reading.lostPackets, " packets of a kernel trace; they are lost");
   }
   return !reading.failure.has_value();
 }
@@ -239,14 +252,14 @@ bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
 void LttngKtraceService::ktrace_session_destroy(const Session& session) {
   const auto ours = std::dynamic_pointer_cast<LttngKtraceSession>(session);
   if (ours == nullptr || ours->state == State::kDestroyed) return;
-  // After the end the recording is with the thread that reads, which removes it.
+  // After the end the recording belongs to the thread that reads it and deletes it.
   const bool isRecording = ours->state == State::kStarted && ours->recording.has_value();
   ours->state = State::kDestroyed;
   if (isRecording) {
     static_cast<void>(control_.end(*ours->recording));
     control_.discard(*ours->recording);
   }
-  // The handlers may refer to who made the session.
+  // The handlers may refer to the session's owner, which may be destroyed next.
   ours->ranges.clear();
   ours->completion = nullptr;
 }

@@ -40,7 +40,7 @@ std::string timeText() {
   return {text.data(), length};
 }
 
-// The names begin with the time, so the oldest comes first.
+// Names begin with the time, so the oldest trace sorts first.
 void removeOldTraces(const std::filesystem::path& directory) {
   std::vector<std::filesystem::path> traces;
   std::error_code error;
@@ -56,7 +56,8 @@ void removeOldTraces(const std::filesystem::path& directory) {
 
 }  // namespace
 
-// What the service and its sessions do, always on the service's thread.
+// The work of the service and its sessions. Runs on the service's thread only. Shared with the
+// sessions, which may outlive the service object.
 struct LttngPerformanceTraceService::Work {
   LttngControl& control;
   Counter& started;
@@ -68,7 +69,7 @@ struct LttngPerformanceTraceService::Work {
   std::optional<Error> begin(std::optional<LttngControl::Recording>& recording) {
     started.add();
     LttngControl::Recording begun;
-    // What the tracer tells of loaded libraries is none of a program's own events.
+    // LTTng's own events about loaded libraries are not events of a program.
     const RecordingPlan plan{.event = "*", .filter = {}, .exclusions = {"lttng_ust_*"}};
     if (auto failure = control.begin(plan, begun)) {
       failed.add();
@@ -79,7 +80,7 @@ struct LttngPerformanceTraceService::Work {
     return std::nullopt;
   }
 
-  // Of each trace that started and was not given up, once.
+  // Called once for each trace that started and was not given up.
   void count(const std::optional<Error>& error) { (error ? failed : saved).add(); }
 
   std::optional<Error> end(const LttngControl::Recording& recording) {
@@ -88,7 +89,7 @@ struct LttngPerformanceTraceService::Work {
     return traceError(std::move(*failure));
   }
 
-  // Sets the trace's URL, or tells why there is none.
+  // Sets the URL of the trace, or returns why there is none.
   std::optional<Error> save(const LttngControl::Recording& recording, std::string& url) {
     const std::string name = kTraceStart + timeText() + "-" + std::to_string(++saves) + kTraceEnd;
     const std::filesystem::path archive = control.tracesDirectory() / name;
@@ -104,6 +105,7 @@ namespace {
 
 using Work = LttngPerformanceTraceService::Work;
 
+// One performance trace. See the port for its states; only the queue touches the recording.
 class LttngTraceSession final : public KQTraceSession,
                                 public std::enable_shared_from_this<LttngTraceSession> {
  public:
@@ -113,6 +115,7 @@ class LttngTraceSession final : public KQTraceSession,
   LttngTraceSession& operator=(const LttngTraceSession&) = delete;
   ~LttngTraceSession() override {
     if (!recording_.has_value()) return;
+    // Nobody holds the session: end the recording and delete it without a call of the delegate.
     queue_->async(JobWeight::kMayBlock, [work = work_, recording = std::move(*recording_)] {
       work->givenUp.add();
       static_cast<void>(work->end(recording));
@@ -148,18 +151,22 @@ class LttngTraceSession final : public KQTraceSession,
     const LttngControl::Recording recording = *std::exchange(recording_, std::nullopt);
     auto error = work_->end(recording);
     if (const auto listener = delegate()) listener->kqTraceDidStop(error);
+    // Saved even if the end failed: what was recorded until then may still be of use.
     std::string url;
     const auto saveError = work_->save(recording, url);
     work_->control.discard(recording);
     if (!error) error = saveError;
     work_->count(error);
-    if (error) kLog.error("performance trace failed: ", error->description);
+    if (error) {
+      kLog.error("a performance trace failed: ", error->description,
+                 "; reporting this to its session");
+    }
     if (const auto listener = delegate()) listener->kqTraceDidComplete(url, 0, error);
   }
 
   const std::shared_ptr<Work> work_;
   const std::shared_ptr<DispatchQueue> queue_;
-  std::optional<LttngControl::Recording> recording_;  // touched on the queue alone
+  std::optional<LttngControl::Recording> recording_;  // used on the queue only
   Mutex mutex_;
   std::weak_ptr<KQTraceSessionDelegate> delegate_ HALVOX_GUARDED_BY(mutex_);
 };
@@ -183,7 +190,7 @@ void LttngPerformanceTraceService::close() {
 std::shared_ptr<DispatchQueue> LttngPerformanceTraceService::queue() {
   const MutexLock lock(mutex_);
   if (queue_ == nullptr) {
-    // A stop waits for it on the reporting queue, so it must not run after what gives way.
+    // Not of a lower quality: a stop waits for it on the reporting queue.
     queue_ = platform::dispatch().createSerialQueue(
         "Performance Trace", QualityOfService::kUserInteractive, QueueThreading::kOwnThread);
   }

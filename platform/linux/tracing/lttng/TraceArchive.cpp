@@ -39,7 +39,7 @@ Failure copy(archive* to, int file, std::uint64_t size, const std::filesystem::p
     const ssize_t count = ::read(file, buffer.data(), most);
     if (count < 0 && errno == EINTR) continue;
     if (count < 0) return systemFailure(path);
-    if (count == 0) return path.string() + ": became shorter";
+    if (count == 0) return path.string() + ": the file became shorter while it was packed";
     if (archive_write_data(to, buffer.data(), static_cast<std::size_t>(count)) != count) {
       return archiveFailure(to);
     }
@@ -48,6 +48,8 @@ Failure copy(archive* to, int file, std::uint64_t size, const std::filesystem::p
   return std::nullopt;
 }
 
+// O_NOFOLLOW and the check for a regular file keep anything out of the archive that is not part of
+// the recording.
 Failure addFile(archive* to, const std::filesystem::path& path, const std::string& name) {
   const UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK));
   struct stat status {};
