@@ -107,9 +107,10 @@ class ParsedText {
   [[nodiscard]] PreferenceFileError refusal(std::string_view key) const {
     PreferenceFileError error;
     appendEscaped(error.description, file_.native(), 4096);
-    error.description += ": " + shownName(key) +
-                         " is a table with lines of its own, or stands where it cannot be changed "
-                         "by itself; expected a key with a value behind it, edit the file instead";
+    error.description +=
+        ": " + shownName(key) +
+        " is a table, or cannot be changed alone where it is; expected KEY = VALUE "
+        "on its own lines; edit the file instead";
     return error;
   }
   [[nodiscard]] std::size_t begin(const toml::node& node) const {

@@ -119,9 +119,10 @@ TEST(PreferenceEditingTest, UnsettingRemovesTheLinesOfTheKey) {
 
 TEST(PreferenceEditingTest, TablesWithLinesOfTheirOwnAreRefused) {
   for (const char* text : {"[a]\nb = 1\n", "a.b = 1\n", "[[a]]\nb = 1\n", "[a.b]\n"}) {
-    EXPECT_NE(set(text, "a", "1").find("\"a\" is a table with lines of its own"),
+    EXPECT_NE(set(text, "a", "1").find("\"a\" is a table, or cannot be changed alone"),
               std::string::npos);
-    EXPECT_NE(unset(text, "a").find("\"a\" is a table with lines of its own"), std::string::npos);
+    EXPECT_NE(unset(text, "a").find("\"a\" is a table, or cannot be changed alone"),
+              std::string::npos);
   }
   EXPECT_EQ(set("a = {b = 1}\n", "a", "1"), "a = 1\n");
   EXPECT_EQ(set("a = [{b = 1}]\n", "a", "1"), "a = 1\n");

@@ -118,7 +118,8 @@ std::optional<PreferenceFileError> changePreferenceFile(const std::filesystem::p
   if (!held) return failure(directory, errno);
   if (!lock(held.get(), patience)) {
     if (errno != EWOULDBLOCK) return failure(directory, errno);
-    return PreferenceFileError{directory.native() + ": another program keeps it locked"};
+    return PreferenceFileError{directory.native() +
+                               ": another program has locked this directory; try again later"};
   }
 
   auto content = readPreferenceText(file);

@@ -108,7 +108,8 @@ TEST_F(PreferenceWritingTest, ADirectoryThatStaysLockedIsAnError) {
   ::close(directory);
 
   ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->description, file_.parent_path().native() + ": another program keeps it locked");
+  EXPECT_EQ(error->description, file_.parent_path().native() +
+                                    ": another program has locked this directory; try again later");
   EXPECT_EQ(read(file_), "a = 1\n");
 }
 

@@ -1,4 +1,4 @@
-"""Settings follow while the service runs: preferences in files, notifications by files."""
+"""Settings take effect while the service runs: preferences from files, notifications by files."""
 
 import contextlib
 import ctypes
@@ -18,15 +18,15 @@ from harness import CTL, Service, iterate_until, wait_for
 
 DOMAIN = "com.tarno.halvox"
 NOTIFICATION = "com.tarno.halvox.reporting"
-# How soon a change has to be everywhere.
+# The time within which a change must be effective everywhere.
 SOON = 1.0
-# Changes within this time of each other are one change to the service, with something to spare.
+# Changes within this time of each other are one change for the service. It includes a margin.
 ONE_SAVE = 0.04
 SETUP = 8, 5  # category and type
 
 
 def exchange(first, second):
-    """Gives each of two files the other's name, at once."""
+    """Exchanges the names of two files in one step."""
     current_directory, exchange_flag = -100, 2
     libc = ctypes.CDLL(None, use_errno=True)
     if libc.renameat2(current_directory, os.fsencode(first), current_directory, os.fsencode(second),
@@ -64,14 +64,14 @@ class Settings(unittest.TestCase):
         return len(self.service.log())
 
     def wait_for_change(self, mark, count=1):
-        """The log from the mark on, once that many changes have been handled."""
+        """The log from the mark on, after that many changes have been handled."""
         def handled():
             log = self.log_since(mark)
             return log if len(re.findall(r"defaults (\(null\)|\{)", log)) >= count else None
         return wait_for("a handled change", handled)
 
     def wait_for_state(self, mark, name):
-        """The log from the mark on, once a state with that name has been sent."""
+        """The log from the mark on, after a state with that name has been sent."""
         def handled():
             log = self.log_since(mark)
             return log if re.search(rf"defaults \{{.*{name}.*\}}", log) else None
@@ -82,13 +82,13 @@ class Settings(unittest.TestCase):
             self.assertEqual(log.count(f"sending message for session owned by {session}\n"), 1, log)
 
     def wait_for_message(self, mark, session):
-        """When the session got a message, in seconds since 1970."""
+        """The time at which the session received a message, in seconds since 1970."""
         line = wait_for(f"a message of session {session}", lambda: re.search(
             rf"^(\S+) .*sending message for session owned by {session}$", self.log_since(mark), re.M))
         return datetime.datetime.fromisoformat(line[1].replace("Z", "+00:00")).timestamp()
 
     def setup_messages(self):
-        """What the link's store has of the state: session (-1: sent singly) and payload."""
+        """The state messages in the link's store: session (-1: a single message) and payload."""
         if not self.service.database.exists():
             return []
         with contextlib.closing(
@@ -123,13 +123,13 @@ class Settings(unittest.TestCase):
         for session in (101, 102):
             client.create(session)
         delays = []
-        # A busy machine may hold us up now and then, but not each time.
+        # A busy machine may delay us now and then, but not each time.
         for number in range(5):
             mark = self.mark()
             self.set_device_name(f"number {number}")
             changed = self.file.stat().st_mtime
             delays.append(max(self.wait_for_message(mark, session) for session in (101, 102)) - changed)
-            # What the change still leads to belongs to it and not to the next.
+            # Whatever else the change causes belongs to it and not to the next one.
             self.wait_for_state(mark, f"number {number}")
 
         self.assertLess(min(delays), SOON, delays)
@@ -170,7 +170,7 @@ class Settings(unittest.TestCase):
 
     def test_one_save_is_one_message_however_it_is_saved(self):
         self.ctl("notify", NOTIFICATION)
-        # Settled together with or after all that the line above has led to.
+        # Settled together with or after everything that the line above has caused.
         self.set_device_name("one")
         self.wait_for_state(0, "one")
         client = self.client()
@@ -192,13 +192,14 @@ class Settings(unittest.TestCase):
             with self.subTest(name):
                 mark = self.save_at_once(save)
                 self.assertIn(name, self.wait_for_change(mark))
-                # A post of our own comes behind whatever else the save might have led to.
+                # A post of our own comes after everything that the save may have caused.
                 os.utime(self.notify / NOTIFICATION)
                 self.wait_for_change(mark, 2)
                 self.assertEqual(len(re.findall(r"feature \d+ changes", self.log_since(mark))), 2)
 
     def save_at_once(self, save):
-        """Saves; a save in which we were held up was two, and is done again. The log's end before."""
+        """Saves. If we were delayed, the save was two changes and is repeated. Returns the end of
+        the log before it."""
         for number in range(20):
             mark = self.mark()
             begin = time.monotonic()
@@ -211,7 +212,7 @@ class Settings(unittest.TestCase):
         self.fail("this machine cannot save a file at once")
 
     def assert_told_and_mended(self, spoil, reason):
-        """A spoilt file is told once, changes nothing, and works again when it is mended."""
+        """A broken file is logged once, changes nothing, and works again after it is fixed."""
         self.set_device_name("before")
         self.wait_for_change(0)
         client = self.client()
@@ -246,7 +247,7 @@ class Settings(unittest.TestCase):
 
     def test_a_directory_in_the_place_of_a_preference_file(self):
         def replace():
-            # In one step: without a file, the preference is removed.
+            # In one step: without a file, the preference would be removed.
             directory = Path(tempfile.mkdtemp(dir=self.service.directory))
             exchange(self.file, directory)
         self.assert_told_and_mended(replace, "expected a regular file")
@@ -259,21 +260,21 @@ class Settings(unittest.TestCase):
             self.ctl("notify", NOTIFICATION)
             self.wait_for_change(mark)
             if round_ > 0:
-                self.assertIn("the notify directory is there again: ", self.log_since(mark))
-            # Settled together with or after all that the post has led to.
+                self.assertIn("exists again; watching it", self.log_since(mark))
+            # Settled together with or after everything that the post has caused.
             self.set_device_name(f"round {round_}")
             self.wait_for_state(mark, f"round {round_}")
             mark = self.mark()
             shutil.rmtree(self.notify)
-            wait_for("the loss to be told",
-                     lambda: "the notify directory is gone, waiting for it: " in self.log_since(mark))
+            wait_for("the log line about the loss",
+                     lambda: "was deleted; waiting until it exists again" in self.log_since(mark))
             self.assertEqual(client.valid(101)["reporterID"], 101)
             self.assertNotRegex(self.log_since(mark), r"feature \d+ changes")
 
     def test_waiting_for_settings_makes_no_wake_ups(self):
         self.set_device_name("Kitchen")
         self.wait_for_change(0)
-        # Quiet once nothing has happened for a while.
+        # Quiet when nothing has happened for a while.
         before = -1
         def is_quiet():
             nonlocal before

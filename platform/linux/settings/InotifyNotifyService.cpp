@@ -61,7 +61,8 @@ NotifyStatus InotifyNotifyService::notify_register_dispatch(std::string_view nam
                                                             std::shared_ptr<DispatchQueue> queue,
                                                             Handler handler) {
   if (!isUsableName(name)) {
-    kLog.error("refused the notification ", shownName(name), ": it cannot be a file's name");
+    kLog.error("cannot register for the notification ", shownName(name),
+               ": expected a name that a file can have; it will never be posted");
     return kNotifyInvalidName;
   }
   // Read the state before the thread adopts the registration. The thread compares with it and so
@@ -146,13 +147,14 @@ void InotifyNotifyService::arm() {
   if (error) {
     retryAt_ = Clock::now() + kRetryTime;
     if (!wasFailing) {
-      kLog.error("changed settings go unnoticed: their directories cannot be watched: ",
-                 error.message());
+      kLog.error("cannot watch the directories of the settings: ", error.message(),
+                 "; changes go unnoticed until that succeeds; trying again every ",
+                 kRetryTime.count(), " s");
     }
   } else if (wasFailing) {
-    kLog.notice("changed settings are noticed again");
+    kLog.notice("watching the directories of the settings again");
   }
-  tellOfNotifyDirectory();
+  logNotifyDirectory();
   settings_.noteEverything();
   noteNews();
 }
@@ -173,15 +175,16 @@ bool InotifyNotifyService::isNotifyLink(std::size_t directory, std::string_view 
 
 // Logs that the notify directory was deleted, which explains why notifications stop, and that it is
 // back. A directory that was never created is not worth a line.
-void InotifyNotifyService::tellOfNotifyDirectory() {
+void InotifyNotifyService::logNotifyDirectory() {
   const bool isThere = watch_.isThere(kNotifyDirectory);
   if (isThere == std::exchange(hasNotifyDirectory_, isThere)) return;
   if (!isThere) {
-    kLog.notice("the notify directory is gone, waiting for it: ",
-                watch_.path(kNotifyDirectory).native());
+    kLog.notice("the notify directory ", watch_.path(kNotifyDirectory).native(),
+                " was deleted; waiting until it exists again");
     notifyDirectoryWasGone_ = true;
   } else if (notifyDirectoryWasGone_) {
-    kLog.notice("the notify directory is there again: ", watch_.path(kNotifyDirectory).native());
+    kLog.notice("the notify directory ", watch_.path(kNotifyDirectory).native(),
+                " exists again; watching it");
   }
 }
 

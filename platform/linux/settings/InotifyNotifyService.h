@@ -17,6 +17,7 @@
 
 namespace halvox::platform::linux_ {
 
+// Returned for a name that a file cannot have, and for every other failure.
 inline constexpr NotifyStatus kNotifyInvalidName = 1;
 inline constexpr NotifyStatus kNotifyFailed = 1'000'000;
 
@@ -68,7 +69,7 @@ class InotifyNotifyService final : public NotifyService {
   void arm();
   void followLinks();
   [[nodiscard]] bool isNotifyLink(std::size_t directory, std::string_view file) const;
-  void tellOfNotifyDirectory();
+  void logNotifyDirectory();
   void readChanges();
   void noteNews();
   void deliver();

@@ -79,7 +79,7 @@ TEST_F(InotifyNotifyServiceTest, NamesThatCannotBeFilesAreRefused) {
               kNotifyInvalidName);
     EXPECT_EQ(token, 77);
   }
-  EXPECT_EQ(linesWith("refused the notification"), 5U);
+  EXPECT_EQ(linesWith("cannot register for the notification"), 5U);
 }
 
 TEST_F(InotifyNotifyServiceTest, AFileThatIsMadeTouchedOrWrittenPostsItsName) {

@@ -28,7 +28,7 @@ PreferenceFileError problem(const std::filesystem::path& file, std::string_view 
 }
 
 PreferenceFileError problem(const std::filesystem::path& file, int error) {
-  return problem(file, ": the preferences cannot be read: " + errnoText(error));
+  return problem(file, ": cannot read the preferences: " + errnoText(error));
 }
 
 PreferenceFileError tooLarge(const std::filesystem::path& file, std::size_t size) {
@@ -47,7 +47,7 @@ std::variant<std::optional<PreferenceText>, PreferenceFileError> readText(
   }
   struct stat status {};
   if (::fstat(descriptor.get(), &status) != 0) return problem(file, errno);
-  if (!S_ISREG(status.st_mode)) return problem(file, ": expected a regular file, found another");
+  if (!S_ISREG(status.st_mode)) return problem(file, ": expected a regular file");
   if (static_cast<std::size_t>(status.st_size) > kLargestPreferenceFile) {
     return tooLarge(file, static_cast<std::size_t>(status.st_size));
   }

@@ -14,7 +14,7 @@ namespace {
 
 constexpr UnitLog kLog(settingsCategory, "PreferenceReader");
 // With more entries, all are forgotten, and a mistake may be logged a second time.
-constexpr std::size_t kMostTold = 64;
+constexpr std::size_t kMostLogged = 64;
 
 // Identifies the state of a file, so that a file saved again with the same mistake is logged again.
 std::string stateOf(const std::filesystem::path& file) {
@@ -31,37 +31,37 @@ std::optional<Dictionary> PreferenceReader::read(std::string_view user,
   const auto file = preferencePath(directory_, user, domain);
   if (!file.has_value()) {
     const std::string names = "user " + shownName(user) + ", domain " + shownName(domain);
-    tell(names, "", names + ": refused, these cannot name a file of preferences");
+    logOnce(names, "", names + ": expected names that a file can have; the values count as absent");
     return std::nullopt;
   }
   auto content = readPreferences(*file);
   if (const auto* error = std::get_if<PreferenceFileError>(&content)) {
-    tell(file->native(), error->description + stateOf(*file),
-         error->description + "; until it is mended, its values count as absent");
+    logOnce(file->native(), error->description + stateOf(*file),
+            error->description + "; until it is fixed, its values count as absent");
     return std::nullopt;
   }
-  tellMended(file->native());
+  logFixed(file->native());
   return std::get<Dictionary>(std::move(content));
 }
 
-void PreferenceReader::tell(const std::string& subject, const std::string& state,
-                            const std::string& line) const {
+void PreferenceReader::logOnce(const std::string& subject, const std::string& state,
+                               const std::string& line) const {
   {
     const MutexLock held(mutex_);
-    const auto known = told_.find(subject);
-    if (known != told_.end() && known->second == state) return;
-    if (told_.size() >= kMostTold) told_.clear();
-    told_.insert_or_assign(subject, state);
+    const auto known = logged_.find(subject);
+    if (known != logged_.end() && known->second == state) return;
+    if (logged_.size() >= kMostLogged) logged_.clear();
+    logged_.insert_or_assign(subject, state);
   }
   kLog.error("", line);
 }
 
-void PreferenceReader::tellMended(const std::string& file) const {
+void PreferenceReader::logFixed(const std::string& file) const {
   {
     const MutexLock held(mutex_);
-    if (told_.erase(file) == 0) return;
+    if (logged_.erase(file) == 0) return;
   }
-  kLog.notice("", file, ": the preferences can be read again");
+  kLog.notice("", file, ": the preferences can be read again; using their values");
 }
 
 }  // namespace halvox::platform::linux_

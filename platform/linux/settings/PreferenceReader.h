@@ -11,10 +11,11 @@
 
 namespace halvox::platform::linux_ {
 
-// Reads preference files for the service, and logs what is wrong with them. A mistake is logged
-// once for each state of the file, however often the file is read; that it was fixed is logged once
-// too. Owned by the platform. Any thread may call. Reads the file on each call, so it blocks on the
-// disk.
+// Reads preference files for the service, and logs what is wrong with them.
+//
+// A mistake is logged once for each state of the file, however often the file is read, because
+// clients trigger the reads. That the file was fixed is logged once, too. Owned by the platform.
+// Any thread may call. Reads the file on each call, so it blocks on the disk.
 class PreferenceReader {
  public:
   explicit PreferenceReader(std::filesystem::path directory) : directory_(std::move(directory)) {}
@@ -28,14 +29,14 @@ class PreferenceReader {
       HALVOX_EXCLUDES(mutex_);
 
  private:
-  void tell(const std::string& subject, const std::string& state, const std::string& line) const
+  void logOnce(const std::string& subject, const std::string& state, const std::string& line) const
       HALVOX_EXCLUDES(mutex_);
-  void tellMended(const std::string& file) const HALVOX_EXCLUDES(mutex_);
+  void logFixed(const std::string& file) const HALVOX_EXCLUDES(mutex_);
 
   const std::filesystem::path directory_;
   mutable Mutex mutex_;
   // What was logged last about each bad file or name. Bounded, because clients choose names.
-  mutable std::map<std::string, std::string, std::less<>> told_ HALVOX_GUARDED_BY(mutex_);
+  mutable std::map<std::string, std::string, std::less<>> logged_ HALVOX_GUARDED_BY(mutex_);
 };
 
 }  // namespace halvox::platform::linux_

@@ -127,7 +127,7 @@ TEST_F(TomlPreferenceServiceTest, NamesThatLeaveTheDirectoryAreRefusedAndToldOnc
   }
 
   EXPECT_EQ(platform_.log.lines().size(), 5U);
-  EXPECT_EQ(linesWith("user \"..\", domain \"secret\": refused"), 1U);
+  EXPECT_EQ(linesWith("user \"..\", domain \"secret\": expected names that a file can have"), 1U);
 }
 
 TEST_F(TomlPreferenceServiceTest, ABrokenFileIsToldOnceWithItsPlaceAndCountsAsAbsent) {
