@@ -24,7 +24,7 @@ using testing::simpleChannel;
 using ::testing::SizeIs;
 using Clock = std::chrono::steady_clock;
 
-// A source that a test can hold up.
+// A source whose readings a test can delay.
 class Gate {
  public:
   void close() { set(false); }
@@ -78,8 +78,7 @@ class LinuxIOReportServiceTest : public ::testing::Test {
 
   FakePlatform platform_;
   Gate gate_;
-  // Before serve(): as long as no busy machine makes a reading late, unless the test wants it to
-  // be.
+  // Call before serve(). The default is long enough that no reading is late on a busy machine.
   std::chrono::milliseconds longestWait_ = 10s;
   std::unique_ptr<LinuxIOReportService> service_;
 };
@@ -103,7 +102,7 @@ TEST_F(LinuxIOReportServiceTest, AGroupIsChosenByItsNamesAndAnAbsentNameMeansAny
   EXPECT_EQ(service.IOReportGetChannelCount(find("Tx", std::nullopt)), 0);
 }
 
-// As in a report, which lets go of each group's samples before it takes the next one's.
+// As in a report, which releases the samples of each group before it takes the next ones.
 TEST_F(LinuxIOReportServiceTest, AllGroupsOfAMomentShareOneReading) {
   std::atomic<int> readings{0};
   const std::vector channels{simpleChannel("Tx", "a"), simpleChannel("Rx", "b")};
@@ -123,7 +122,7 @@ TEST_F(LinuxIOReportServiceTest, AllGroupsOfAMomentShareOneReading) {
   EXPECT_EQ(readings, 1);
 }
 
-// Readings that a test lets end one by one, each of its own number.
+// Readings that a test finishes one by one. Each contains its own number.
 class SteppedReadings {
  public:
   std::shared_ptr<const Reading> make() {
@@ -166,7 +165,7 @@ TEST_F(LinuxIOReportServiceTest, AReadingThatWasBegunBeforeIsNotUsedAndTheNextOn
   std::jthread asker([&] { first = show(sample(found)); });
   readings.waitUntilBegun(before + 1);
 
-  // They ask while that reading is being made, and wait for the next one.
+  // They ask during that reading and wait for the next one.
   const auto asked = [this] {
     return platform_.statistics.values("driver source made").at("readings asked for");
   };
@@ -222,9 +221,10 @@ TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndTheLogTellsItO
   gate_.open();
 
   EXPECT_LT(time, SourceReader::kLongestWait);
-  EXPECT_THAT(platform_.log.texts(LogLevel::kError),
-              ElementsAre("the driver counters of made did not come within 50 ms and are left out "
-                          "until they do"));
+  EXPECT_THAT(
+      platform_.log.texts(LogLevel::kError),
+      ElementsAre("driver source made did not answer within 50 ms; its counters are skipped "
+                  "until it answers in time"));
 }
 
 TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
@@ -244,7 +244,7 @@ TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
   EXPECT_THAT(show(sample(found)), SizeIs(1));
 }
 
-// It counted since its driver was loaded, not since the session began.
+// Its counts begin when its driver was loaded, not when the session began.
 TEST_F(LinuxIOReportServiceTest, WhatASourceThatWasLateAtTheSnapshotCountedIsNotReported) {
   longestWait_ = 200ms;
   const auto channel = simpleChannel("Tx", "a");
@@ -307,7 +307,7 @@ TEST_F(LinuxIOReportServiceTest, TheLeaseIsReleasedWhenNobodyHoldsSamples) {
   auto samples = sample(find("Tx", std::nullopt));
   EXPECT_TRUE(isHeld());
   samples.reset();
-  // The thread that made the reading may hold it for a moment after it has handed it over.
+  // The thread that made the reading may hold it for a moment after handing it over.
   const auto deadline = Clock::now() + 10s;
   while (isHeld() && Clock::now() < deadline) std::this_thread::yield();
 
@@ -327,7 +327,7 @@ TEST_F(LinuxIOReportServiceTest, ReadingsAskedForAreGivenOrLate) {
 
   const auto counted = platform_.statistics.values("driver source made");
   EXPECT_EQ(counted.at("readings asked for"),
-            counted.at("readings given") + counted.at("left out: late"));
+            counted.at("readings given") + counted.at("skipped: late"));
 }
 
 TEST_F(LinuxIOReportServiceTest, ManyThreadsMaySampleAtOnce) {
@@ -353,7 +353,7 @@ TEST_F(LinuxIOReportServiceTest, ManyThreadsMaySampleAtOnce) {
         values.push_back(channel.integerValue);
         return 0;
       });
-      // Both channels of a reading are of one moment.
+      // Both channels of a reading are from the same moment.
       if (values.size() == 2 && values[0] != values[1]) ++wrong;
     });
   }

@@ -16,14 +16,14 @@ std::string pieceOf(const DriverSource& source) {
 
 }  // namespace
 
-// asked for = given + left out.
+// The counters balance: asked for = given + skipped.
 SourceReader::SourceReader(std::unique_ptr<DriverSource> source, StatisticsService& statistics,
                            std::chrono::milliseconds longestWait)
     : source_(std::move(source)),
       longestWait_(longestWait),
       received_(statistics.counter(pieceOf(*source_), "readings asked for")),
       given_(statistics.counter(pieceOf(*source_), "readings given")),
-      late_(statistics.counter(pieceOf(*source_), "left out: late")) {}
+      late_(statistics.counter(pieceOf(*source_), "skipped: late")) {}
 
 SourceReader::~SourceReader() {
   {
@@ -42,15 +42,15 @@ void SourceReader::startOpening() {
 void SourceReader::waitUntilOpen() {
   bool isFirstLate = false;
   if (receive(opening_, isFirstLate) != nullptr) return;
-  kLog.error("the driver counters of ", source_->name(), " did not come within ",
-             opening_.wait.count(), " ms; they are left out until the service starts again");
+  kLog.error("driver source ", source_->name(), " did not open within ", opening_.wait.count(),
+             " ms; its counters are not reported until the service restarts");
 }
 
 SourceReader::Asked SourceReader::ask(std::chrono::milliseconds wait) {
   const MutexLock lock(mutex_);
   const std::uint64_t number = want();
   received_.add();
-  // A source that is late is read all the same, to see whether it has come round.
+  // A late source is read all the same, to find out whether it is in time again.
   if (isLate_) return {};
   ++waiting_;
   return {.number = number, .isWaiting = true, .wait = wait, .deadline = Clock::now() + wait};
@@ -60,8 +60,8 @@ std::shared_ptr<const Reading> SourceReader::take(const Asked& asked) {
   bool isFirstLate = false;
   ReadingPointer reading = receive(asked, isFirstLate);
   if (isFirstLate) {
-    kLog.error("the driver counters of ", source_->name(), " did not come within ",
-               asked.wait.count(), " ms and are left out until they do");
+    kLog.error("driver source ", source_->name(), " did not answer within ", asked.wait.count(),
+               " ms; its counters are skipped until it answers in time");
   }
   return reading;
 }
@@ -77,7 +77,7 @@ SourceReader::ReadingPointer SourceReader::receive(const Asked& asked, bool& isF
   return reading;
 }
 
-// Has a reading made that is begun after this; returns its number.
+// Requests a reading that begins after this call. Returns its number.
 std::uint64_t SourceReader::want() {
   const std::uint64_t number = lastBegun_ + 1;
   if (lastWanted_ < number) {
@@ -87,7 +87,7 @@ std::uint64_t SourceReader::want() {
   return number;
 }
 
-// Null when it is late.
+// Null if it is late.
 SourceReader::ReadingPointer SourceReader::waitFor(std::uint64_t number,
                                                    Clock::time_point deadline) {
   bool inTime = true;
@@ -115,11 +115,11 @@ void SourceReader::makeReadings() {
     mutex_.lock();
     if (time <= longestWait_) isLate_ = false;
     lastMade_ = lastBegun_;
-    // Also when they wait for the next one, which takes its place.
+    // Also for those who wait for the next reading: it will replace this one.
     if (waiting_ > 0) std::swap(handedOver_, reading);
     made_.notifyAll();
     mutex_.unlock();
-    // What the source does when nobody holds its reading any more must hold up no asker.
+    // Releasing a reading may call the source, which must not delay those who ask.
     reading.reset();
     mutex_.lock();
   }

@@ -20,11 +20,12 @@ namespace {
 
 constexpr UnitLog kLog(driversCategory, "GraphFollower");
 
-// The first answer tells that all objects were announced, the second that all told their state.
+// The server has announced all objects before the first answer, and sent their states before the
+// second.
 constexpr int kRoundTrips = 2;
 
-// A socket has its name before it takes connections, and a server that ends takes some to the last:
-// so a few attempts are made after one appeared or went.
+// A socket appears before it accepts connections, and a server that ends may accept some until the
+// last moment. A few attempts are therefore made after a socket appeared or a server went.
 constexpr int kAttempts = 5;
 constexpr auto kPauseBetweenAttempts = std::chrono::milliseconds(200);
 
@@ -48,9 +49,9 @@ std::optional<NodeState> nodeState(pw_node_state state) {
   return std::nullopt;
 }
 
-// Only what is needed: nothing of the user's configuration, no real-time scheduling, no bus.
+// Only what is needed: no user configuration, no real-time scheduling, no bus.
 pipewire::UniqueContext makeContext(pw_loop* loop) {
-  // The library warns of what is left out, unless somebody debugs it.
+  // The library warns about the missing parts. They are missing on purpose.
   if (std::getenv("PIPEWIRE_DEBUG") == nullptr) pw_log_set_level(SPA_LOG_LEVEL_ERROR);
   pipewire::UniqueContext context(
       pw_context_new(loop, pw_properties_new(PW_KEY_CONFIG_NAME, "null", nullptr), 0));
@@ -60,14 +61,14 @@ pipewire::UniqueContext makeContext(pw_loop* loop) {
     return nullptr;
   }
   if (!pipewire::loadProfilerModule(context.get())) {
-    kLog.error("PipeWire's profiler module is not installed: no cycles will be counted");
+    kLog.error("PipeWire's profiler module is not installed; cycles and xruns are not counted");
   }
   return context;
 }
 
 }  // namespace
 
-// A sink or a source: tells its states.
+// Follows the states of one sink or source.
 class GraphFollower::Node {
  public:
   Node(GraphFollower& connection, GlobalID id)
@@ -99,7 +100,10 @@ GraphFollower::GraphFollower(pw_loop* loop, SharedGraph& graph)
       watch_(loop, [this] { serverAppeared(); }),
       context_(timer_ != nullptr ? makeContext(loop) : nullptr),
       server_(context_.get(), *this) {
-  if (context_ == nullptr) kLog.error("cannot set up PipeWire's library: ", errnoText(errno));
+  if (context_ == nullptr) {
+    kLog.error("cannot set up PipeWire's library: ", errnoText(errno),
+               "; PipeWire counters are disabled until the service restarts");
+  }
 }
 
 GraphFollower::~GraphFollower() {
@@ -139,7 +143,7 @@ void GraphFollower::proceed() {
 }
 
 void GraphFollower::lookForServer() {
-  // First, so that none appears unseen after the attempt.
+  // Before the attempt: a socket that appears after it must be noticed.
   watch_.begin();
   if (attempts_ == 0) return;
   --attempts_;
@@ -155,7 +159,8 @@ void GraphFollower::connect() {
     return;
   }
   if (!std::exchange(isMissingTold_, true)) {
-    kLog.info("no PipeWire: ", errnoText(errno), "; it is waited for while sessions run");
+    kLog.info("cannot connect to PipeWire: ", errnoText(errno),
+              "; waiting for it while sessions run");
   }
   settle();
 }
@@ -182,7 +187,7 @@ void GraphFollower::settle() {
 void GraphFollower::proceedAfter(std::optional<Clock::duration> pause) {
   timespec value{};
   if (pause.has_value()) {
-    // Nothing would stop the timer.
+    // A time of 0 would stop the timer instead.
     const auto positive = std::max<Clock::duration>(*pause, std::chrono::milliseconds(1));
     const auto seconds = std::chrono::floor<std::chrono::seconds>(positive);
     value.tv_sec = seconds.count();
@@ -227,8 +232,8 @@ void GraphFollower::onServerReached(const pw_core_info& server) {
 
 void GraphFollower::onServerLost() {
   isLost_ = true;
-  kLog.notice("PipeWire has gone");
-  // Let the timer disconnect: the library does not allow that within this call.
+  kLog.notice("the connection to PipeWire ended; waiting for the server while sessions run");
+  // Lets the timer disconnect: the library does not allow that inside this call.
   proceedAfter(Clock::duration::zero());
 }
 
@@ -259,7 +264,7 @@ void GraphFollower::onGlobalRemoved(GlobalID id) {
 }
 
 void GraphFollower::onRefused(GlobalID id, const char* message) {
-  kLog.info("PipeWire refused: ", message, " (object ", id, ")");
+  kLog.info("PipeWire refused a request: ", message, " (object ", id, "); it is ignored");
 }
 
 void GraphFollower::onAnswered() {

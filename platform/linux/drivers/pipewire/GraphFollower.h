@@ -16,19 +16,25 @@
 
 namespace halvox::platform::linux_ {
 
-// Follows a PipeWire server and writes what it tells into the graph. All of it runs on the loop's
-// thread, except construction and destruction, while that thread does not run. Borrows loop and
-// graph. A server that goes or is not there is no error; it is waited for as PipeWireDriverSource
+// Follows a PipeWire server and writes its events into the graph.
+//
+//   waiting --a connection succeeds--> following --the server has gone--> waiting
+//
+// Threads: everything runs on the loop's thread, except construction and destruction, which happen
+// while that thread does not run. PipeWireDriverSource owns it; it borrows the loop and the graph.
+// Failure: a server that is missing or goes away is not an error; PipeWireDriverSource says when it
+// is looked for.
 // says.
 class GraphFollower final : private pipewire::ServerListener {
  public:
   GraphFollower(pw_loop* loop, SharedGraph& graph);
   ~GraphFollower() override;
 
-  // False when the library cannot be used at all, which is logged.
+  // False if the library cannot be used at all, which is logged.
   [[nodiscard]] bool isUsable() const { return context_ != nullptr; }
-  // Connects or waits for the server, and binds or lets go of the profiler, as the graph's lease
-  // says. Never from within a callback of the server's objects, because it may destroy them.
+  // Connects to the server or waits for it, and binds or releases the profiler, depending on the
+  // graph's lease. Must not be called from a callback of the server's objects, because it may
+  // destroy them.
   void update();
 
  private:
@@ -37,13 +43,13 @@ class GraphFollower final : private pipewire::ServerListener {
   class Node;
 
   [[nodiscard]] bool isLeased();
-  // Does what is due without asking for another attempt to connect.
+  // The work of update() without another attempt to connect.
   void proceed();
   void lookForServer();
   void connect();
   void disconnect();
   void settle();
-  // Has proceed() run after that time, or not any more.
+  // Runs proceed() after that time; none cancels it.
   void proceedAfter(std::optional<Clock::duration> pause);
   void serverAppeared();
   void updateProfiler(bool isWanted);
@@ -61,7 +67,7 @@ class GraphFollower final : private pipewire::ServerListener {
   SharedGraph& graph_;
   spa_source* timer_ = nullptr;
   ServerWatch watch_;
-  int attempts_ = 0;  // to connect, that are left
+  int attempts_ = 0;  // remaining attempts to connect
   bool isTried_ = false;
   bool isLost_ = false;
   bool isMissingTold_ = false;

@@ -9,15 +9,15 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The group of a node's class; empty when it is neither sink nor source. What is both at once
-// counts as a sink.
+// The group for a media class; empty if it is neither sink nor source. A node that is both counts
+// as a sink.
 std::string_view groupOf(std::string_view mediaClass) {
   if (mediaClass == "Audio/Sink" || mediaClass == "Audio/Duplex") return kSinkGroup;
   if (mediaClass == "Audio/Source" || mediaClass == "Audio/Source/Virtual") return kSourceGroup;
   return {};
 }
 
-// At most kLongestName bytes of it, and no part of a character.
+// The first kLongestName bytes at most, cut between characters.
 std::string cleanName(std::string_view name) {
   std::size_t length = 0;
   while (length < name.size()) {
@@ -28,7 +28,7 @@ std::string cleanName(std::string_view name) {
   return replaceInvalidUtf8(name.substr(0, length));
 }
 
-// What the key of a channel in a report has of its driver's name.
+// The part of a driver's name that the keys of a report contain.
 std::string readName(std::string_view name) {
   std::string read(name.substr(0, name.find('<')));
   std::erase_if(read, [](char letter) { return letter == '_' || letter == ' '; });
@@ -71,7 +71,7 @@ void GraphStatistics::keep(std::unique_ptr<NodeStatistics> node, Time now) {
   gone_.push_back(std::move(node));
 }
 
-// Those of the node of that name that went before, else new ones.
+// The statistics of the node of that name that has disappeared; new ones if there is none.
 std::unique_ptr<NodeStatistics> GraphStatistics::statisticsOf(std::string_view group,
                                                               const std::string& name) {
   const auto found = std::ranges::find_if(gone_, [&](const auto& node) {
@@ -94,7 +94,7 @@ void GraphStatistics::cycleEnded(const pipewire::ProfiledCycle& cycle) {
   const auto [found, isFirst] = drivers_.try_emplace(cycle.driver->id);
   Driver& driver = found->second;
   const bool isRepeated = !isFirst && driver.lastCycle == cycle.time;
-  // A driver that starts anew may count anew.
+  // A driver that restarts may begin its count again.
   const bool hasXruns = !isFirst && cycle.driverXruns > driver.xruns;
   const std::uint32_t xruns = hasXruns ? cycle.driverXruns - driver.xruns : 0;
   driver = {.lastCycle = cycle.time, .xruns = cycle.driverXruns};
@@ -123,7 +123,7 @@ NodeStatistics* GraphStatistics::find(NodeID id) {
   return found == nodes_.end() ? nullptr : found->second.get();
 }
 
-// The number stands before any "<", so that it is in what is read of the name.
+// Inserts the ID before any "<", because the keys of a report omit everything after it.
 std::string GraphStatistics::nameFor(NodeID id, std::string_view group,
                                      std::string_view name) const {
   std::string own = cleanName(name);

@@ -16,37 +16,43 @@
 
 namespace halvox::platform::linux_ {
 
-// What is counted of the sinks and sources of one PipeWire server after another, by what the server
-// tells. Nodes are known by the server's ids; an id that comes again is another node. A node that
-// goes has no channels any more. When one of its class and name comes, of this server or the next,
-// it has the same channels and their counts go on, so what a session counted before is not lost.
-// Knows no PipeWire and no clock: whoever tells gives the time. Not thread-safe.
+// Counts what the sinks and sources of a PipeWire server do, across restarts of the server.
+//
+// Nodes are identified by the server's IDs; an ID that is used again is another node. When a node
+// disappears, its channels do too. When a node of the same class and name appears, on this server
+// or the next, it gets the same channels and their counts continue, so a session does not lose what
+// was counted before. This is only possible because the counts are made here and contain nothing
+// else.
+//
+// It uses neither PipeWire nor a clock, so that tests need neither: the caller passes events and
+// times. Not thread-safe; SharedGraph owns and guards it. Cannot fail.
 class GraphStatistics {
  public:
   using Time = NodeStatistics::Time;
   using NodeID = std::uint32_t;
 
-  // More sinks and sources than that are left out: a client may make any number.
+  // Further sinks and sources are ignored: any client can create nodes.
   static constexpr std::size_t kMostNodes = 256;
-  static constexpr std::size_t kLongestName = 128;  // bytes; names are cut there
+  static constexpr std::size_t kLongestName = 128;  // bytes; longer names are cut
 
   GraphStatistics();
 
   void serverReached() { ++connections_; }
-  // All of its nodes are gone.
+  // The server has gone, and with it all nodes.
   void serverLost(Time now);
-  // Measuring begins, after a time in which nothing was told of cycles.
+  // The profiler begins, after a time in which cycles were not reported.
   void profilingBegan();
 
-  // False when the node is neither sink nor source, or one too many; nothing more need be told of
-  // it then. A node whose name would be read like that of another is called "name#id".
+  // Returns false if the node is neither sink nor source, or is one too many; its further events
+  // are not needed then. If the key of a report would be equal for two nodes, the later one is
+  // called "name#id".
   bool nodeAdded(NodeID id, std::string_view mediaClass, std::string_view name);
   void nodeRemoved(NodeID id, Time now);
   void nodeStateChanged(NodeID id, std::optional<NodeState> state, Time now);
-  // A cycle that is told twice in a row, as PipeWire does when one was missed, counts once.
+  // PipeWire reports a cycle twice in a row if one was missed; the second report is ignored.
   void cycleEnded(const pipewire::ProfiledCycle& cycle);
 
-  // All channels: the connections, then those of the nodes by their ids.
+  // Adds all channels: the connections, then those of the nodes by ID.
   void addTo(ReadingMaker& maker, Time now) const;
 
  private:
@@ -63,9 +69,9 @@ class GraphStatistics {
   std::array<ChannelList::Channel, 2> connectionsChannels_;
   std::uint64_t connections_ = 0;
   std::map<NodeID, std::unique_ptr<NodeStatistics>> nodes_;
-  // Of nodes that are gone, the newest last; at most kMostNodes.
+  // Of nodes that have disappeared, the newest last; at most kMostNodes, the oldest is forgotten.
   std::deque<std::unique_ptr<NodeStatistics>> gone_;
-  std::map<NodeID, Driver> drivers_;  // also those that are neither sink nor source
+  std::map<NodeID, Driver> drivers_;  // including nodes that are neither sink nor source
 };
 
 }  // namespace halvox::platform::linux_

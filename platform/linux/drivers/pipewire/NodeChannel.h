@@ -8,12 +8,12 @@
 
 namespace halvox::platform::linux_ {
 
-// The groups under which sinks and sources are read, and the subgroup of both.
+// The groups of the channels of sinks and sources, and the subgroup of both.
 inline constexpr const char* kSinkGroup = "Speaker";
 inline constexpr const char* kSourceGroup = "Rx";
 inline constexpr const char* kPipeWireSubGroup = "PipeWire";
 
-// A counter of this source, to be made a channel of another format where that is meant.
+// Describes a counter of this source. The caller changes the format for other channels.
 inline ChannelDescription describeNodeChannel(std::string group, std::string driver,
                                               std::string name) {
   ChannelDescription channel;

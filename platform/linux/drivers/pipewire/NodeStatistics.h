@@ -12,20 +12,19 @@
 
 namespace halvox::platform::linux_ {
 
-// How long the work of a node took, in microseconds: hits of fixed buckets, of which the last is
-// open.
+// Counts durations in microseconds in fixed buckets; the last bucket is open. A plain value.
 class DurationHistogram {
  public:
   static constexpr std::size_t kBuckets = 11;
-  // Where each bucket starts; it ends where the next one starts.
+  // The lower bound of each bucket. It ends at the lower bound of the next one.
   static constexpr std::array<std::int64_t, kBuckets> kLowerBounds{
       0, 50, 100, 200, 500, 1'000, 2'000, 5'000, 10'000, 20'000, 50'000};
 
   [[nodiscard]] static std::vector<BucketBounds> bounds();
 
-  // Negative durations count as none.
+  // A negative duration counts as 0.
   void add(std::chrono::nanoseconds duration);
-  // The numbers of its channel.
+  // The values of its channel.
   [[nodiscard]] const std::array<std::uint64_t, kBuckets>& values() const { return hits_; }
 
  private:
@@ -34,8 +33,8 @@ class DurationHistogram {
 
 enum class NodeState : std::uint8_t { kRunning, kIdle, kSuspended };
 
-// How often and how long a node was in each state. Times are those of one clock that never goes
-// back.
+// Counts how often and how long a node was in each state. A plain value. Times come from one clock
+// that does not go back.
 class StateResidency {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -43,12 +42,12 @@ class StateResidency {
 
   [[nodiscard]] static std::vector<std::string> names();
 
-  // None: it is in no state that counts. The state it is in already is no transition, nor is the
-  // first one that is known.
+  // None means a state that is not counted. Setting the current state again is not a transition,
+  // and neither is the first known state.
   void change(std::optional<NodeState> state, Time now);
-  // It is not there any more; the state in which it is when it comes again is the first one.
+  // The node has disappeared. The first state after its return is not a transition.
   void leave(Time now);
-  // The numbers of its channel: for each state transitions and microseconds, up to now.
+  // The values of its channel: transitions and microseconds of each state, up to now.
   [[nodiscard]] std::array<std::uint64_t, 2 * kStates> values(Time now) const;
 
  private:
@@ -62,19 +61,18 @@ class StateResidency {
   Time since_{};
 };
 
-// What is counted of one sink or source, and the channels that it is read as.
-// Belongs to GraphStatistics.
+// The counts of one sink or source and its channels. GraphStatistics owns and calls it.
 class NodeStatistics {
  public:
   using Time = StateResidency::Time;
 
-  // `group` is that of the channels, `driverName` their driver.
+  // `group` and `driverName` are those of the channels.
   NodeStatistics(const std::string& group, const std::string& driverName);
 
   void cycleEnded(const pipewire::ProfiledNode& node);
   void xrunsHappened(std::uint32_t count) { xruns_ += count; }
   void stateChanged(std::optional<NodeState> state, Time now) { states_.change(state, now); }
-  // The node is gone. Its counts go on when one of its name comes.
+  // The node has disappeared. Its counts continue if a node of its name appears.
   void left(Time now) { states_.leave(now); }
   void addTo(ReadingMaker& maker, Time now) const;
   [[nodiscard]] const std::string& driverName() const { return *cyclesChannel_->driverName; }

@@ -15,8 +15,8 @@ namespace {
 
 constexpr UnitLog kLog(driversCategory, "PipeWireDriverSource");
 
-// Wakes the loop from any thread; does nothing once the loop is gone. Shared by the source and the
-// leases, which may outlive it.
+// Wakes the loop from any thread; does nothing after the loop has been destroyed. Shared by the
+// source and the leases, because a session may hold its snapshot longer than the source exists.
 class Bell {
  public:
   void install(pw_loop* loop, spa_source* event) {
@@ -36,7 +36,7 @@ class Bell {
   spa_source* event_ HALVOX_GUARDED_BY(mutex_) = nullptr;
 };
 
-// What readings hold. Rings when the last of them goes.
+// Held by readings. Rings when the last of them is destroyed, so that the profiler is released.
 class Lease {
  public:
   explicit Lease(std::shared_ptr<Bell> bell) : bell_(std::move(bell)) {}
@@ -66,7 +66,9 @@ class PipeWireDriverSource::Impl {
 
   void open() {
     if (!start()) {
-      kLog.error("cannot start the thread that follows PipeWire: it is left out");
+      kLog.error(
+          "cannot start the PipeWire thread; PipeWire counters are disabled until the service "
+          "restarts");
       return;
     }
     bell_->ring();
@@ -100,7 +102,7 @@ class PipeWireDriverSource::Impl {
 
  private:
   bool start() {
-    // The kernel shows at most 15 letters of a thread's name.
+    // The kernel allows 15 characters for a thread's name.
     loop_ = pw_thread_loop_new("halvox-pipewire", nullptr);
     if (loop_ == nullptr) return false;
     pw_loop* const loop = pw_thread_loop_get_loop(loop_);
@@ -118,7 +120,7 @@ class PipeWireDriverSource::Impl {
   const Options options_;
   const std::shared_ptr<Bell> bell_ = std::make_shared<Bell>();
   SharedGraph graph_;
-  ReadingMaker maker_;  // of the thread of readings
+  ReadingMaker maker_;  // used by the thread of readings
   pw_thread_loop* loop_ = nullptr;
   spa_source* event_ = nullptr;
   std::unique_ptr<GraphFollower> connection_;

@@ -7,22 +7,22 @@
 
 namespace halvox::platform::linux_ {
 
-// What a PipeWire server counts of its sinks (group "Speaker") and sources (group "Rx"): cycles,
-// xruns, the times of each cycle, and the states of the nodes.
+// Reports what a PipeWire server does with its sinks (group "Speaker") and sources (group "Rx"):
+// cycles, xruns, the times of each cycle, and the states of the nodes.
 //
-// The server is followed on a thread of the library's own, which sleeps until the server tells
-// something: while nobody holds a reading, only that nodes come, go or change their state. Its
-// profiler, which tells of each cycle, is bound while somebody holds a reading, so a node's cycles
-// are those of such times; the first reading begins one.
-//
-// When there is no server, it is looked for when somebody begins to hold a reading, and met as soon
-// as its socket appears while somebody does; the same when the server goes. Nothing wakes up in the
-// meantime. Until it is there, the only channels are "connections", which count how often it was
-// reached.
+// Threads: the library has a thread that follows the server. It sleeps until the server sends an
+// event. While nobody holds a reading, events come only when nodes appear, disappear or change
+// their state. The profiler, which reports each cycle, is bound only while someone holds a reading:
+// an idle service must not wake up for every cycle. A node's cycles are therefore those of such
+// times; the first reading begins one.
+// Owner: its SourceReader, which calls it on one thread.
+// Failure: without a server there are only the channels "connections", which count how often the
+// server was reached. It is looked for when the first reading is held, and it is connected to as
+// soon as its socket appears while a reading is held. Nothing wakes up meanwhile.
 class PipeWireDriverSource final : public DriverSource {
  public:
   struct Options {
-    // How long open() waits for what the server has.
+    // How long open() waits for the server's objects. Below SourceReader::kLongestOpening.
     std::chrono::milliseconds longestOpening{800};
   };
 
@@ -35,7 +35,7 @@ class PipeWireDriverSource final : public DriverSource {
   // Never waits for the server.
   [[nodiscard]] std::shared_ptr<const Reading> read() override;
 
-  // Whether the profiler is bound at the moment. Any thread.
+  // Whether the profiler is bound at the moment. Any thread may call. For tests.
   [[nodiscard]] bool isProfiling() const;
 
  private:

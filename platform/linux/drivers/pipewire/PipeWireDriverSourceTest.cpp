@@ -33,7 +33,7 @@ std::vector<std::string> linesOf(const std::shared_ptr<const Reading>& reading,
   return lines;
 }
 
-// The value of a simple channel; -1 when it is not there.
+// The value of a simple channel; -1 if there is no such channel.
 std::int64_t valueOf(const std::shared_ptr<const Reading>& reading, std::string_view start) {
   std::int64_t value = -1;
   testing::samplesOf(reading).iterate([&](const IOReportChannel& channel) {
@@ -43,7 +43,7 @@ std::int64_t valueOf(const std::shared_ptr<const Reading>& reading, std::string_
   return value;
 }
 
-// What the histogram's buckets were hit, and the channel's greatest value.
+// The hits of the histogram's buckets, and the channel's greatest value.
 struct Seen {
   std::uint64_t hits = 0;
   std::int64_t greatest = 0;
@@ -61,12 +61,12 @@ Seen histogramOf(const std::shared_ptr<const Reading>& reading, std::string_view
 
 constexpr std::string_view kCycles = "demo-speakers/Speaker/PipeWire/cycles";
 
-// Without a server to ask.
+// There is no server.
 TEST(PipeWireDriverSourceAloneTest, OnlyTheConnectionsAreThereAndOpeningDoesNotWait) {
   const FakePlatform platform;
   const ScratchDirectory directory;
   setenv("XDG_RUNTIME_DIR", directory.path().c_str(), 1);
-  // Were it to wait, it would be for that long.
+  // If it waited, the test would take this long.
   PipeWireDriverSource source({.longestOpening = 1h});
   const auto start = Clock::now();
 
@@ -119,7 +119,7 @@ TEST_F(PipeWireDriverSourceTest, TheFirstReadingHasTheNodesAndTheirStates) {
   EXPECT_EQ(valueOf(reading, "pipewire/Speaker/PipeWire/connections"), 1);
   EXPECT_EQ(valueOf(reading, kCycles), 0);
   EXPECT_EQ(linesOf(reading, "demo-speakers/").size(), 5U);
-  // It is in some state, and for some time.
+  // The node is in some state, and has been for some time.
   EXPECT_THAT(linesOf(source->read(), "demo-speakers/Speaker/PipeWire/state us"),
               ElementsAre(::testing::MatchesRegex(".*= (idle|suspended):0:[1-9][0-9]*")));
 }
@@ -130,7 +130,7 @@ TEST_F(PipeWireDriverSourceTest, CyclesOfAPlaybackAreCountedWhileAReadingIsHeld)
   ChildProcess player = play(2);
 
   ASSERT_EQ(player.wait(), 0);
-  // 2 s of cycles of at most 2048 frames.
+  // Two seconds of cycles of at most 2,048 frames.
   ASSERT_TRUE(eventually([&] { return valueOf(source->read(), kCycles) >= 46; }));
 
   const auto last = source->read();

@@ -13,7 +13,7 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr const char* kDefaultName = "pipewire-0";
-// Where the library looks for a server of the whole machine when the user has none.
+// The library looks here for a server of the whole machine if the user has none.
 constexpr const char* kSystemDirectory = "/run/pipewire";
 
 std::string remoteName() {
@@ -35,7 +35,7 @@ ServerWatch::ServerWatch(pw_loop* loop, std::function<void()> onAppeared)
   const std::filesystem::path remote = remoteName();
   name_ = remote.filename();
   for (const std::string& directory : runtimeDirectories()) {
-    // An absolute name needs no directory, and takes the place of any.
+    // If the name is absolute, the operator discards the directory.
     directories_.push_back((std::filesystem::path(directory) / remote).parent_path());
   }
 }
@@ -74,7 +74,7 @@ ServerWatch::News ServerWatch::takeNews() const {
     if (size <= 0) return news;
     for (std::size_t at = 0; at < static_cast<std::size_t>(size);) {
       const auto* event = reinterpret_cast<const inotify_event*>(&buffer[at]);
-      // Events that were lost may have been those of the name.
+      // Events were lost; one of them may have been about the name.
       if ((event->mask & IN_Q_OVERFLOW) != 0) news.hasAppeared = true;
       if ((event->mask & IN_IGNORED) != 0) news.isDirectoryGone = true;
       if (event->len > 0 && name_ == event->name) news.hasAppeared = true;
@@ -86,7 +86,7 @@ ServerWatch::News ServerWatch::takeNews() const {
 void ServerWatch::onReadable(void* data, int /*descriptor*/, std::uint32_t /*mask*/) {
   auto* self = static_cast<ServerWatch*>(data);
   const News news = self->takeNews();
-  // What is left of the directories is watched on.
+  // Continue with the directories that still exist.
   if (news.isDirectoryGone) {
     self->end();
     self->begin();

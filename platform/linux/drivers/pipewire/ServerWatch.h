@@ -11,25 +11,27 @@
 
 namespace halvox::platform::linux_ {
 
-// Tells on the loop's thread when something appears under the name of the PipeWire server's socket.
-// Where that is, the environment says at construction, by the library's own rules. Watches only
-// between begin() and end(), and costs nothing while nothing is created beside the socket.
-// Belongs to the loop's thread, or to whoever knows that it does not run. Without the directory, or
-// without inotify, it just never tells anything.
+// Calls back on the loop's thread when a file appears under the name of the PipeWire server's
+// socket.
+//
+// The environment at construction decides where that is, by the library's own rules. It watches
+// only between begin() and end(), with inotify instead of a timer, so that waiting for a server
+// costs nothing. Belongs to the loop's thread, or to a caller that knows that this thread does not
+// run. GraphFollower owns it. Without the directory, or without inotify, it never calls back.
 class ServerWatch {
  public:
-  // `onAppeared` may end the watch.
+  // `onAppeared` may call end().
   ServerWatch(pw_loop* loop, std::function<void()> onAppeared);
   ~ServerWatch() { end(); }
   ServerWatch(const ServerWatch&) = delete;
   ServerWatch& operator=(const ServerWatch&) = delete;
 
-  // Starts to watch, or tries again to; does nothing when it watches already.
+  // Starts to watch, or tries again. Does nothing while it watches.
   void begin();
   void end();
 
  private:
-  // What has happened since the last time.
+  // The events since the last call.
   struct News {
     bool hasAppeared = false;
     bool isDirectoryGone = false;

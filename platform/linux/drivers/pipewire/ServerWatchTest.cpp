@@ -33,7 +33,7 @@ class ServerWatchTest : public ::testing::Test {
   }
   ~ServerWatchTest() override { unsetenv("PIPEWIRE_REMOTE"); }
 
-  // How often something was told of what has happened so far.
+  // The number of calls so far.
   int told() {
     while (pw_loop_iterate(loop.get(), 0) > 0) {
     }
@@ -122,7 +122,7 @@ TEST_F(ServerWatchTest, ADirectoryThatGoesEndsItsWatchQuietly) {
 
   std::filesystem::remove(gone);
   EXPECT_EQ(told(), 0);
-  // Nothing is left that would wake the loop.
+  // Nothing remains that would wake the loop.
   EXPECT_EQ(pw_loop_iterate(loop.get(), 0), 0);
 
   std::filesystem::create_directory(gone);

@@ -7,15 +7,15 @@
 
 namespace halvox::platform::linux_ {
 
-// What the thread of readings and the thread that follows the server share. Owned by the source,
+// Shared by the thread of readings and the thread that follows the server. The source owns it; it
 // outlives the connection.
 struct SharedGraph {
   Mutex mutex{};
   Condition settled{};
   GraphStatistics statistics HALVOX_GUARDED_BY(mutex){};
-  // Held by all readings that somebody holds.
+  // Each reading holds a copy. It is expired if nobody holds a reading.
   std::weak_ptr<void> lease HALVOX_GUARDED_BY(mutex){};
-  bool isSettled HALVOX_GUARDED_BY(mutex) = false;  // the server was asked once, or is not there
+  bool isSettled HALVOX_GUARDED_BY(mutex) = false;  // the server was asked once, or is missing
   bool isProfiling HALVOX_GUARDED_BY(mutex) = false;
 };
 

@@ -122,20 +122,22 @@ INSTANTIATE_TEST_SUITE_P(
         WrongText{"HalfWritten", "# TYPE a gauge\na 1\na{x=\"",
                   "line 3: expected the end of a text in quotes"},
         WrongText{"CutInANumber", "# TYPE a gauge\na 12",
-                  "line 2: the line has no end: the file is half-written"},
-        WrongText{"BehindTheEnd", "# EOF\na 1\n", "line 2: expected nothing behind # EOF"},
-        WrongText{"NotUtf8", "# TYPE a gauge\na{b=\"\xff\"} 1\n", "line 2: expected UTF-8"},
-        WrongText{"LongLine", "# " + std::string(9000, 'x') + "\n", "line 1: the line is too long"},
+                  "line 2: the last line has no line break: the file is incomplete"},
+        WrongText{"BehindTheEnd", "# EOF\na 1\n", "line 2: expected nothing after # EOF"},
+        WrongText{"NotUtf8", "# TYPE a gauge\na{b=\"\xff\"} 1\n",
+                  "line 2: the line is not valid UTF-8"},
+        WrongText{"LongLine", "# " + std::string(9000, 'x') + "\n",
+                  "line 1: expected a line of at most 8192 bytes"},
         WrongText{"Twice", "# TYPE a gauge\na{x=\"1\",y=\"2\"} 1\na{y=\"2\",x=\"1\"} 1\n",
-                  "line 3: the value was told before"},
+                  "line 3: this value appears twice"},
         WrongText{"TwoTypes", "# TYPE a gauge\n# TYPE a counter\n",
-                  "line 2: the type of a was told before"},
+                  "line 2: the type of a is declared twice"},
         WrongText{"LateType", "a 1\n# TYPE a gauge\n",
-                  "line 2: the type of a comes behind its values"},
+                  "line 2: the type of a is declared after its values"},
         WrongText{"UnknownType", "# TYPE a number\n", "line 1: expected a type of metric"},
         WrongText{"OtherUnit", "# UNIT a ms\n# UNIT a us\n",
-                  "line 2: another unit of a was told before"},
-        WrongText{"LabelTwice", "a{x=\"1\",x=\"2\"} 1\n", "line 1: the label x is there twice"},
+                  "line 2: the unit of a is declared twice with different values"},
+        WrongText{"LabelTwice", "a{x=\"1\",x=\"2\"} 1\n", "line 1: the label x appears twice"},
         WrongText{"WrongEscape", "a{x=\"\\t\"} 1\n",
                   "line 1: expected \\n, \\\\ or \\\" as the only escapes"},
         WrongText{"NoNumber", "a one\n", "line 1: expected a number"},
@@ -147,28 +149,28 @@ INSTANTIATE_TEST_SUITE_P(
                   "line 2: expected a count, from 0 to 9223372036854775807"},
         WrongText{"NotCumulative",
                   "# TYPE a histogram\na_bucket{le=\"1\"} 5\na_bucket{le=\"+Inf\"} 4\n",
-                  "line 3: expected no fewer hits than in the bucket before"},
+                  "line 3: expected at least the hits of the previous bucket"},
         WrongText{"BoundsBackwards",
                   "# TYPE a histogram\na_bucket{le=\"2\"} 1\na_bucket{le=\"1\"} 1\n",
-                  "line 3: expected a higher bound than that of the bucket before"},
+                  "line 3: expected a greater bound than that of the previous bucket"},
         WrongText{"NoInfiniteBucket", "# TYPE a histogram\na_bucket{le=\"1\"} 5\na_count 5\n",
                   "line 2: expected a bucket with le=\"+Inf\""},
         WrongText{"OtherCount", "# TYPE a histogram\na_bucket{le=\"+Inf\"} 5\na_count 4\n",
-                  "line 3: expected the count of the bucket with le=\"+Inf\""},
+                  "line 3: expected the same count as the bucket with le=\"+Inf\""},
         WrongText{"FractionBound", "# TYPE a histogram\na_bucket{le=\"0.5\"} 5\n",
-                  "line 2: expected a whole number of the unit, or +Inf, as the bucket's bound"},
+                  "line 2: expected a whole number or +Inf as the bucket's bound"},
         WrongText{"BareHistogram", "# TYPE a histogram\na 5\n",
-                  "line 2: a is no value of a metric of the type of a"},
+                  "line 2: the name a does not suit the type of a"},
         WrongText{"StateWithoutResidency",
                   "# TYPE a stateset\na{a=\"x\"} 1\n# TYPE a_transitions counter\n"
                   "a_transitions_total{a=\"x\"} 1\n",
                   "line 2: expected a counter a_residency"},
         WrongText{"SameChannel",
                   "# TYPE a gauge\na{channel=\"x\"} 1\n# TYPE b gauge\nb{channel=\"x\"} 1\n",
-                  "line 4: this channel was told before, in line 2"}),
+                  "line 4: this channel is already in line 2"}),
     [](const auto& one) { return one.param.name; });
 
-// The text has as many values of each of three metrics, the first two of the given type.
+// A text with that number of values for each of three metrics. The first two have the given type.
 std::string threeMetrics(const std::string& type, const std::string& counters) {
   constexpr int kChannels = 5'800;
   std::string states = "# TYPE m " + type + "\n";
@@ -184,7 +186,7 @@ std::string threeMetrics(const std::string& type, const std::string& counters) {
   return states + residency + transitions;
 }
 
-// Of this thread, so that other work of the machine does not count.
+// The CPU time of this thread, so that other work of the machine does not count.
 double secondsToRead(const std::string& text) {
   const auto now = [] {
     timespec time{};
@@ -198,12 +200,12 @@ double secondsToRead(const std::string& text) {
 }
 
 TEST(MetricChannelsTest, StatesAreFoundAmongManyWithoutLookingAtAll) {
-  // What as many values of a type take that makes no channels.
+  // The time for as many values of a type that makes no channels.
   const double plain = secondsToRead(threeMetrics("info", "unknown"));
   const double states = secondsToRead(threeMetrics("stateset", "counter"));
 
   EXPECT_GT(plain, 0);
-  // Looking at all counters for each state takes ten times as long.
+  // Searching all counters for each state took ten times as long.
   EXPECT_LT(states, 5 * plain);
 }
 
@@ -213,10 +215,11 @@ TEST(OpenMetricsTextTest, SizesAreBounded) {
   std::string samples;
   for (int sample = 0; sample <= 20'000; ++sample) samples += "a" + std::to_string(sample) + " 1\n";
 
-  EXPECT_THAT(channelsOf("a{" + labels + "} 1\n"), ElementsAre("line 1: too many labels"));
-  EXPECT_THAT(channelsOf(samples), ElementsAre("line 20001: too many values"));
+  EXPECT_THAT(channelsOf("a{" + labels + "} 1\n"),
+              ElementsAre("line 1: expected at most 32 labels"));
+  EXPECT_THAT(channelsOf(samples), ElementsAre("line 20001: expected at most 20000 values"));
   EXPECT_THAT(channelsOf(std::string((1U << 20U) + 1, '\n')),
-              ElementsAre("line 1: the file is too large"));
+              ElementsAre("line 1: expected at most 1048576 bytes"));
 }
 
 }  // namespace

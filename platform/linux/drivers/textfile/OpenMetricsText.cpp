@@ -14,7 +14,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Thrown and caught in this file only: a mistake in the current line.
+// Thrown and caught in this file only: the current line has an error.
 struct Mistake {
   std::string what;
 };
@@ -25,7 +25,7 @@ bool isLetter(char character) {
 }
 bool isDigit(char character) { return character >= '0' && character <= '9'; }
 
-// Walks through one line.
+// Reads one line from left to right. Throws a Mistake where something else is expected.
 class LineCursor {
  public:
   explicit LineCursor(std::string_view line) : rest_(line) {}
@@ -54,7 +54,7 @@ class LineCursor {
     if (size == 0) throw Mistake{std::string("expected ") + what};
     return take(size);
   }
-  // A text in quotes, without its escapes.
+  // A quoted text without its quotes and escapes.
   std::string takeText() {
     expect('"', "a text in quotes");
     std::string text;
@@ -105,23 +105,25 @@ MetricLabels parseLabels(LineCursor& line) {
   MetricLabels labels;
   line.skipBlanks();
   while (!line.skip('}')) {
-    if (labels.size() == OpenMetricsText::kMostLabels) throw Mistake{"too many labels"};
+    if (labels.size() == OpenMetricsText::kMostLabels) {
+      throw Mistake{"expected at most " + std::to_string(OpenMetricsText::kMostLabels) + " labels"};
+    }
     std::string name(line.takeName("a label or }", false));
     line.skipBlanks();
-    line.expect('=', "= behind the label");
+    line.expect('=', "= after the label");
     line.skipBlanks();
     labels.push_back({std::move(name), line.takeText()});
     line.skipBlanks();
-    if (!line.skip(',') && !line.startsWith('}')) throw Mistake{"expected , or } behind the label"};
+    if (!line.skip(',') && !line.startsWith('}')) throw Mistake{"expected , or } after the label"};
     line.skipBlanks();
   }
   std::ranges::sort(labels);
   const auto twice = std::ranges::adjacent_find(labels, {}, &MetricLabel::name);
-  if (twice != labels.end()) throw Mistake{"the label " + twice->name + " is there twice"};
+  if (twice != labels.end()) throw Mistake{"the label " + twice->name + " appears twice"};
   return labels;
 }
 
-// What a sample's name may have behind the name of a family of that type.
+// Whether a sample's name may have this suffix after the name of a family of that type.
 bool takesSuffix(MetricType type, std::string_view suffix) {
   if (suffix.empty()) return type != MetricType::kHistogram;
   switch (type) {
@@ -152,6 +154,7 @@ std::optional<MetricType> typeNamed(std::string_view name) {
   return found->second;
 }
 
+// Parses one text. Used once. The first error ends it: a file that has one is not used at all.
 class Parser {
  public:
   std::variant<OpenMetricsText::Families, MetricError> parse(std::string_view text) {
@@ -166,15 +169,17 @@ class Parser {
  private:
   void parseLines(std::string_view text) {
     line_ = 1;
-    if (text.size() > OpenMetricsText::kLargestText) throw Mistake{"the file is too large"};
+    if (text.size() > OpenMetricsText::kLargestText) {
+      throw Mistake{"expected at most " + std::to_string(OpenMetricsText::kLargestText) + " bytes"};
+    }
     while (!text.empty()) {
       const std::size_t end = text.find('\n');
       const std::string_view line = text.substr(0, end);
-      if (isEnded_) throw Mistake{"expected nothing behind # EOF"};
+      if (isEnded_) throw Mistake{"expected nothing after # EOF"};
       checkLine(line);
       parseLine(line);
       if (end == std::string_view::npos && !isEnded_) {
-        throw Mistake{"the line has no end: the file is half-written"};
+        throw Mistake{"the last line has no line break: the file is incomplete"};
       }
       text.remove_prefix(end == std::string_view::npos ? text.size() : end + 1);
       ++line_;
@@ -182,8 +187,11 @@ class Parser {
   }
 
   static void checkLine(std::string_view line) {
-    if (line.size() > OpenMetricsText::kLongestLine) throw Mistake{"the line is too long"};
-    if (!isUtf8(line)) throw Mistake{"expected UTF-8"};
+    if (line.size() > OpenMetricsText::kLongestLine) {
+      throw Mistake{"expected a line of at most " + std::to_string(OpenMetricsText::kLongestLine) +
+                    " bytes"};
+    }
+    if (!isUtf8(line)) throw Mistake{"the line is not valid UTF-8"};
   }
 
   void parseLine(std::string_view text) {
@@ -216,15 +224,17 @@ class Parser {
 
   void setType(const std::string& name, MetricType type) {
     MetricFamily& family = familyNamed(name);
-    if (!typed_.insert(name).second) throw Mistake{"the type of " + name + " was told before"};
-    if (!family.samples.empty()) throw Mistake{"the type of " + name + " comes behind its values"};
+    if (!typed_.insert(name).second) throw Mistake{"the type of " + name + " is declared twice"};
+    if (!family.samples.empty()) {
+      throw Mistake{"the type of " + name + " is declared after its values"};
+    }
     family.type = type;
   }
 
   void setUnit(const std::string& name, std::string_view unit) {
     MetricFamily& family = familyNamed(name);
     if (!family.unit.empty() && family.unit != unit) {
-      throw Mistake{"another unit of " + name + " was told before"};
+      throw Mistake{"the unit of " + name + " is declared twice with different values"};
     }
     family.unit = unit;
   }
@@ -237,6 +247,7 @@ class Parser {
     line.skipBlanks();
     sample.number = parseNumber(line.takeUntilBlank());
     line.skipBlanks();
+    // A time stamp. Counters are sampled now, so it has no use here.
     if (!line.isAtEnd() && !line.startsWith('#'))
       static_cast<void>(parseNumber(line.takeUntilBlank()));
     line.skipBlanks();
@@ -257,22 +268,26 @@ class Parser {
   }
 
   void addSample(const std::string& name, MetricSample sample) {
-    if (++sampleCount_ > OpenMetricsText::kMostSamples) throw Mistake{"too many values"};
+    if (++sampleCount_ > OpenMetricsText::kMostSamples) {
+      throw Mistake{"expected at most " + std::to_string(OpenMetricsText::kMostSamples) +
+                    " values"};
+    }
     std::string series = name;
-    // A label's value holds any character, so its length keeps two series apart.
+    // A label's value may contain any character. Its length keeps two series apart.
     for (const auto& label : sample.labels) {
       series += '\n' + label.name + '=' + std::to_string(label.value.size()) + ':' + label.value;
     }
-    if (!series_.insert(std::move(series)).second) throw Mistake{"the value was told before"};
+    if (!series_.insert(std::move(series)).second) throw Mistake{"this value appears twice"};
     MetricFamily& family = familyOfSample(name);
     sample.suffix = name.substr(family.name.size());
     if (!takesSuffix(family.type, sample.suffix)) {
-      throw Mistake{name + " is no value of a metric of the type of " + family.name};
+      throw Mistake{"the name " + name + " does not suit the type of " + family.name};
     }
     family.samples.push_back(std::move(sample));
   }
 
-  // The family whose name is that of the sample, or the beginning of it as its type allows.
+  // The family with the sample's name, or with that name without its last suffix if the type allows
+  // the suffix.
   MetricFamily& familyOfSample(const std::string& name) {
     if (!positions_.contains(name)) {
       const std::size_t underscore = name.rfind('_');
@@ -287,6 +302,7 @@ class Parser {
     return familyNamed(name);
   }
 
+  // The family of that name, added if it is new.
   MetricFamily& familyNamed(const std::string& name) {
     const auto [found, isNew] = positions_.try_emplace(name, families_.size());
     if (isNew) families_.push_back({.name = name});
@@ -328,7 +344,7 @@ std::optional<MetricNumber> MetricNumber::parse(std::string_view text) {
 std::optional<std::int64_t> MetricNumber::cutDown() const {
   if (whole.has_value()) return whole;
   const double down = std::floor(value);
-  // Written so that a NaN is out of range; the bound itself is 2 to the 63rd.
+  // Written so that a NaN fails. The upper bound is 2^63 itself, which 64 bits cannot hold.
   if (!(down >= -0x1p63 && down < 0x1p63)) return std::nullopt;
   return static_cast<std::int64_t>(down);
 }

@@ -16,8 +16,8 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr UnitLog kLog(driversCategory, "RemovedFiles");
-// Not files that are moved away: each update by renaming is such an event, of another name, and
-// between two sessions they would fill what the kernel keeps.
+// Without IN_MOVED_FROM: each update by renaming causes such an event for another name, and between
+// two sessions these would fill the kernel's queue.
 constexpr std::uint32_t kEvents = IN_DELETE | IN_MOVE_SELF | IN_ONLYDIR;
 
 }  // namespace
@@ -34,7 +34,7 @@ RemovedFiles::Removed RemovedFiles::take() {
       if ((event->mask & IN_Q_OVERFLOW) != 0) {
         removed.areAll = true;
       } else if (event->wd != watched_) {
-        continue;  // of a directory that is not watched any more
+        continue;  // from a directory that is not watched any more
       } else if ((event->mask & IN_DELETE) != 0) {
         removed.names.emplace_back(event->name);
       } else {
@@ -54,11 +54,12 @@ void RemovedFiles::watch() {
   if (!inotify_) inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (inotify_) watched_ = ::inotify_add_watch(inotify_.get(), directory_.c_str(), kEvents);
   if (watched_ != -1) return;
-  // What cannot be opened has no files either.
+  // A directory that cannot be opened has no files either, so there is nothing to log.
   const bool isNoDirectory = errno == ENOENT || errno == ENOTDIR || errno == EACCES;
   if (isNoDirectory || std::exchange(isFailureLogged_, true)) return;
-  kLog.error("cannot watch the directory ", directory_.string(), " for deleted files (",
-             errnoText(errno), "); a file that is deleted and written again counts on");
+  kLog.error("cannot watch the directory ", directory_.string(),
+             " for deleted files: ", errnoText(errno),
+             "; a file that is deleted and written again counts as the same file");
 }
 
 }  // namespace halvox::platform::linux_

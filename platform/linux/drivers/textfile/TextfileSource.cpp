@@ -18,11 +18,11 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr UnitLog kLog(driversCategory, "TextfileSource");
-// A file's time goes on in steps of up to 10 ms: a file that was read within one may change again
-// without another time.
+// Twenty milliseconds: file times advance in steps of up to 10 ms. A file that is read within a
+// step may change again and keep its time.
 constexpr std::int64_t kTimeStep = 20'000'000;
 
-constexpr const char* kLeftOut = "; the file is left out";
+constexpr const char* kSkipped = "; skipping the file";
 
 using Directory = UniqueHandle<DIR*, ::closedir>;
 
@@ -55,7 +55,7 @@ std::string reasonOf(const SmallFile& file) {
 std::shared_ptr<const Reading> TextfileSource::read() {
   ++round_;
   std::size_t room = kMostBytes;
-  // Before the files are listed: what is deleted from here on is noticed the next time.
+  // Before the files are listed: whatever is deleted after this is noticed at the next reading.
   forgetRemoved();
   const UniqueFd directory = openDirectory(directory_.c_str());
   for (const std::string& file : directory ? list(directory.get()) : std::vector<std::string>()) {
@@ -97,7 +97,7 @@ std::vector<std::string> TextfileSource::list(int directory) {
   const bool areTooMany = files.size() > kMostFiles;
   if (areTooMany && !std::exchange(hasToldOfTooMany_, true)) {
     kLog.error("the directory ", directory_.string(), " has more than ", kMostFiles,
-               " files; those behind are left out");
+               " files; skipping those after the first ", kMostFiles);
   }
   hasToldOfTooMany_ = areTooMany;
   if (areTooMany) files.resize(kMostFiles);
@@ -111,7 +111,7 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
   if (::fstatat(directory, file.c_str(), &status, 0) != 0) {
     state.error = errno;
   } else {
-    // A file that is too large by itself takes no room.
+    // A file that is too large by itself is skipped anyway and uses up no room.
     const std::size_t size =
         S_ISREG(status.st_mode) && status.st_size <= off_t{OpenMetricsText::kLargestText}
             ? static_cast<std::size_t>(status.st_size)
@@ -131,26 +131,26 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
     entry.channels = {};
     entry.values = {};
     return complain(file,
-                    ": the files before it and this are larger than " + std::to_string(kMostBytes) +
-                        " bytes" + kLeftOut,
+                    ": this file and those before it are larger than " +
+                        std::to_string(kMostBytes) + " bytes together" + kSkipped,
                     entry);
   }
 
   const SmallFile content = readSmallFile(directory, file.c_str(), OpenMetricsText::kLargestText);
   const std::size_t hash = std::hash<std::string>()(content.text);
   const bool isRead = content.outcome == SmallFile::Outcome::kRead;
-  // Few of the files that are looked at again did change again.
+  // Most files that are read again have not changed again. Comparing a hash saves parsing them.
   if (isSame && isRead && entry.hash == hash) return;
   entry.hash = isRead ? std::optional(hash) : std::nullopt;
   entry.isGood = false;
   isChanged_ = true;
-  if (content.outcome == SmallFile::Outcome::kMissing) return;  // gone since it was listed
+  if (content.outcome == SmallFile::Outcome::kMissing) return;  // deleted since it was listed
   if (!isRead) {
-    return complain(file, ": " + reasonOf(content) + kLeftOut, entry);
+    return complain(file, ": " + reasonOf(content) + kSkipped, entry);
   }
   auto parsed = MetricChannels::from(content.text);
   if (const auto* error = std::get_if<MetricError>(&parsed)) {
-    return complain(file, ":" + std::to_string(error->line) + ": " + error->what + kLeftOut, entry);
+    return complain(file, ":" + std::to_string(error->line) + ": " + error->what + kSkipped, entry);
   }
   take(std::move(std::get<std::vector<MetricChannel>>(parsed)), entry);
 }
@@ -185,11 +185,11 @@ void TextfileSource::chooseChannels() {
     for (std::size_t index = 0; index < entry.channels.size(); ++index) {
       if (told.insert(entry.channels[index]->fullName()).second) continue;
       entry.isShown[index] = false;
-      // One line a file, however many channels it shares with others.
+      // One line for each file, however many channels it shares with others.
       if (entry.complaint.empty()) {
         complain(file,
-                 ": a file before it tells the channel " + *entry.channels[index]->channelName +
-                     " too; only that one counts",
+                 ": an earlier file also has the channel " + *entry.channels[index]->channelName +
+                     "; ignoring it in this file",
                  entry);
       }
     }

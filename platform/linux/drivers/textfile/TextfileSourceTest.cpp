@@ -23,7 +23,7 @@ constexpr const char* kPulses = "# TYPE pulses counter\npulses_total{group=\"Hap
 
 class TextfileSourceTest : public ::testing::Test {
  protected:
-  // As a daemon should write: the file is there as a whole or not at all.
+  // Writes as a daemon should: the file appears complete or not at all.
   void write(const std::string& name, const std::string& text) {
     const auto file = directory_.path() / name;
     std::ofstream(file.string() + ".new") << text;
@@ -36,7 +36,7 @@ class TextfileSourceTest : public ::testing::Test {
   std::vector<std::string> errors() { return platform_.log.texts(LogLevel::kError); }
   std::string complaint(const std::string& file, const std::string& what) {
     return "driver counters of " + (directory_.path() / file).string() + what +
-           "; the file is left out";
+           "; skipping the file";
   }
 
   FakePlatform platform_;
@@ -67,13 +67,13 @@ TEST_F(TextfileSourceTest, AChannelKeepsItsIdentityWhileItsFileChanges) {
 TEST_F(TextfileSourceTest, AFileThatIsWrittenInPlaceIsNoticedEvenWithinOneTick) {
   const auto file = directory_.path() / "a.prom";
   for (int count = 1; count < 9; ++count) {
-    std::ofstream(file) << kPulses << count << "\n";  // always of one size
+    std::ofstream(file) << kPulses << count << "\n";  // always the same size
     EXPECT_THAT(show(), ElementsAre("-/Haptics/-/pulses  = " + std::to_string(count)));
   }
 }
 
 TEST_F(TextfileSourceTest, FilesForWhichNoRoomIsLeftAreLeftOutUntilThereIs) {
-  // Each as large as a file may be, so that all of them take the whole room.
+  // Each is as large as a file may be, so that all of them together use up the room.
   for (int number = 0; number < 8; ++number) {
     const std::string name = "level" + std::to_string(number);
     std::string text = "# TYPE " + name + " gauge\n" + name + " 5\n";
@@ -88,9 +88,10 @@ TEST_F(TextfileSourceTest, FilesForWhichNoRoomIsLeftAreLeftOutUntilThereIs) {
 
   EXPECT_THAT(show(), SizeIs(8));
   EXPECT_THAT(show(), SizeIs(8));
-  EXPECT_THAT(errors(),
-              ElementsAre(complaint(
-                  "z.prom", ": the files before it and this are larger than 8388608 bytes")));
+  EXPECT_THAT(
+      errors(),
+      ElementsAre(complaint(
+          "z.prom", ": this file and those before it are larger than 8388608 bytes together")));
 
   std::filesystem::remove(directory_.path() / "level3.prom");
   EXPECT_THAT(show(), ::testing::Contains("-/Haptics/-/pulses  = 3"));
@@ -142,7 +143,7 @@ TEST_F(TextfileSourceTest, ADeletedFilesChannelsAreGoneAndNewOnesWhenTheyComeBac
               IsEmpty());
 }
 
-// Whether or not anybody read the directory in between.
+// Whether or not the directory was read in between.
 TEST_F(TextfileSourceTest, AFileThatIsDeletedAndWrittenAgainBetweenTwoReadingsHasOtherChannels) {
   for (const int count : {2, 10}) {
     writePulses("a.prom", 3);
