@@ -1,4 +1,4 @@
-# Warnings, sanitizers and the shape of our targets, in one place.
+# Warnings, sanitizers and the functions that define our targets, in one place.
 
 find_program(HALVOX_CCACHE ccache)
 if(HALVOX_CCACHE)
@@ -11,8 +11,8 @@ target_compile_options(halvox_flags INTERFACE
   -Werror -Wall -Wextra -Wshadow
   $<$<COMPILE_LANGUAGE:CXX>:-Wconversion -Wnon-virtual-dtor>
   $<$<AND:$<COMPILE_LANGUAGE:CXX>,$<CXX_COMPILER_ID:Clang>>:-Wthread-safety>)
-# GCC 12 sees overruns inside its own std::string when it optimises; clang and the sanitizers judge
-# such things here.
+# GCC 12 reports overruns inside its own std::string when it optimises. clang and the sanitizers
+# check for real ones.
 target_compile_options(halvox_flags INTERFACE
   $<$<CXX_COMPILER_ID:GNU>:-Wno-array-bounds -Wno-restrict -Wno-stringop-overflow -Wno-stringop-overread>)
 target_include_directories(halvox_flags INTERFACE ${CMAKE_SOURCE_DIR})
@@ -24,7 +24,7 @@ if(HALVOX_SANITIZE)
   endif()
   add_link_options(-fsanitize=${HALVOX_SANITIZE})
 endif()
-# A test that runs longer is taken for one that hangs. Sanitized programs are several times slower.
+# A test that runs longer counts as one that hangs. Sanitized programs are several times slower.
 if(HALVOX_SANITIZE)
   set(HALVOX_UNIT_TEST_SECONDS 480)
   set(HALVOX_SYSTEM_TEST_SECONDS 900)
@@ -37,8 +37,8 @@ if(HALVOX_FUZZ)
   add_compile_options(-fsanitize=fuzzer-no-link)
 endif()
 
-# The headers that nearly every source reads, compiled once: one set for libraries, one for tests.
-# The clang preset goes without, so a source that leaves out an include is found there.
+# The headers that nearly every source includes, compiled once: one set for libraries, one for
+# tests. The clang preset does not use them, so that it finds sources with a missing include.
 set(halvox_common_headers
   <algorithm> <atomic> <chrono> <cstdint> <filesystem> <functional> <map> <memory> <mutex> <optional>
   <span> <string> <string_view> <thread> <unordered_map> <utility> <variant> <vector>)
@@ -84,8 +84,8 @@ endfunction()
 add_custom_target(halvox_concurrent_tests)
 
 # halvox_test(<name> SOURCES <files> [DEPENDS <targets>] [LABELS <labels>])
-# A GoogleTest program whose tests CTest lists one by one. Its tests have the label `unit` unless
-# others are given; tests with the label `concurrent` are run under ThreadSanitizer too.
+# A GoogleTest program. CTest lists its tests one by one. They have the label `unit` unless other
+# labels are given; tests with the label `concurrent` also run under ThreadSanitizer.
 function(halvox_test name)
   cmake_parse_arguments(ARG "" "" "SOURCES;DEPENDS;LABELS" ${ARGN})
   if(NOT ARG_LABELS)
@@ -98,8 +98,8 @@ function(halvox_test name)
     add_dependencies(halvox_concurrent_tests ${name})
   endif()
   include(GoogleTest)
-  # Discovery loses all labels of a list but the first, so they become one, which `ctest -L` finds by
-  # any of its parts: unit-concurrent.
+  # The discovery of tests keeps only the first label of a list. The labels therefore become one,
+  # which `ctest -L` finds by any of its parts: unit-concurrent.
   string(REPLACE ";" "-" labels "${ARG_LABELS}")
   gtest_discover_tests(${name} DISCOVERY_MODE PRE_TEST
     PROPERTIES LABELS "${labels}" TIMEOUT ${HALVOX_UNIT_TEST_SECONDS})
@@ -107,7 +107,7 @@ endfunction()
 
 # halvox_fuzzer(<name> SOURCES <files> [DEPENDS <targets>])
 # A libFuzzer program with the `asan` preset; elsewhere the same entry point is linked with a driver.
-# Either runs the files of the seed folder of that name as one ordinary test.
+# Both run the files of the seed folder of that name as one ordinary test.
 function(halvox_fuzzer name)
   cmake_parse_arguments(ARG "" "" "SOURCES;DEPENDS" ${ARGN})
   set(seeds ${CMAKE_SOURCE_DIR}/tests/fuzz/seeds/${name})

@@ -3,7 +3,7 @@
 #include "reporters/pipewire/ReportingClient.h"
 
 // The categories, types, service types and keys that this reporter uses. The numbers are those of
-// the service's wire interface. They stand here again because a client does not include the
+// the service's wire interface. They are repeated here because a client does not include the
 // service's headers.
 namespace halvox::pipewire_reporter {
 

@@ -116,7 +116,7 @@ class StreamWatcher::Impl final : public StreamListener, private pipewire::Serve
 
   struct Stream {
     Properties announced;  // from the registry; the stream's client cannot change these
-    bool told = false;     // the tracker knows the stream
+    bool told = false;     // whether the tracker knows the stream
     std::unique_ptr<StreamBinding> binding;
   };
 

@@ -60,8 +60,8 @@ void logLosses(const halvox::client::Counters& counters, const StreamTracker& tr
   }
 }
 
-// Names the service's socket where the arguments and the environment do not; false when the
-// configuration that would is wrong.
+// Takes the service's socket from the configuration if neither the arguments nor the environment
+// name it. Returns false if the configuration has a mistake.
 bool completeFromConfiguration(Arguments& arguments) {
   const char* variable = std::getenv("HALVOX_SOCKET");
   if (!arguments.socket.empty() || (variable != nullptr && *variable != '\0')) return true;

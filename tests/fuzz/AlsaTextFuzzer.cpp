@@ -1,4 +1,4 @@
-// Hostile text where the kernel tells of sound cards.
+// Feeds hostile text to the parsers of the kernel's files about sound cards.
 
 #include <cstdint>
 #include <cstdlib>

@@ -1,5 +1,5 @@
-// Hostile bytes as an issue metric. Whatever is read can be shown, and written and read again with
-// the same result; reading stays within the bytes and ends.
+// Feeds hostile bytes to the issue metric. Reading must end and must stay within the bytes.
+// Whatever was read can be printed, and written and read again with the same result.
 
 #include <cstdint>
 #include <cstdlib>
@@ -31,7 +31,7 @@ void checkRoundTrip(const AudioIssueDetected& issue) {
   require(!formatter.text().empty() && formatter.text().ends_with("}\n"));
 }
 
-// What was read up to an error is a message like any other.
+// The fields that were read before an error are a valid message.
 void read(std::span<const std::byte> bytes) {
   platform::ProtoReader reader(bytes);
   AudioIssueDetected issue;
@@ -47,7 +47,7 @@ void read(std::span<const std::byte> bytes) {
 }  // namespace halvox::zubmetrics
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  // On a boundary of their own, so that sanitizers see their exact end.
+  // In a block of their own, so that sanitizers see their exact end.
   const std::vector<std::uint8_t> bytes(data, data + size);
   halvox::zubmetrics::read(std::as_bytes(std::span(bytes)));
   return 0;

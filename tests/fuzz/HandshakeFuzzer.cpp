@@ -1,5 +1,5 @@
-// Hostile bytes in a handshake, on either side. The first byte chooses the side and the size of the
-// pieces in which the rest comes.
+// Feeds hostile bytes to the handshake, on either side. The first byte selects the side and the
+// size of the pieces in which the other bytes arrive.
 
 #include <algorithm>
 #include <cstdint>
@@ -41,7 +41,7 @@ Conversation converse(Side side, std::span<const std::byte> input, std::size_t p
   return result;
 }
 
-// In pieces or as a whole, it must come to the same.
+// In pieces or as a whole, the result must be the same.
 template <typename Side>
 void check(const Side& side, std::span<const std::byte> input, std::size_t pieceSize) {
   const Conversation whole = converse(side, input, input.size());

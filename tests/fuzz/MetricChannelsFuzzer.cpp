@@ -1,4 +1,4 @@
-// Hostile metrics in a text file of driver counters.
+// Feeds hostile text to the parser of driver counters in text files.
 
 #include <cstdint>
 #include <cstdlib>

@@ -1,4 +1,4 @@
-// What PipeWire's profiler tells, when it tells anything.
+// Feeds arbitrary bytes to the decoder of PipeWire's profiler events.
 
 #include <cstdint>
 #include <cstdlib>
@@ -31,11 +31,11 @@ void count(const std::vector<pipewire::ProfiledCycle>& cycles) {
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
   if (size < sizeof(spa_pod)) return 0;
-  // Aligned, as the library hands it over.
+  // Aligned, as the library passes it.
   const auto bytes = std::make_unique<std::uint8_t[]>(size);
   std::memcpy(bytes.get(), data, size);
   const auto* pod = reinterpret_cast<const spa_pod*>(bytes.get());
-  // The library hands over nothing that is not there as a whole.
+  // The library passes only objects that are complete.
   if (SPA_POD_SIZE(pod) > size) return 0;
   const auto cycles = pipewire::decodeProfile(pod);
   for (const auto& cycle : cycles) {

@@ -1,5 +1,5 @@
-// Stands in for libFuzzer in ordinary builds: runs the fuzz target once with each file of the
-// folders given as arguments. Fails when there is nothing to run.
+// Replaces libFuzzer in ordinary builds: runs the fuzz target once for each file of the directories
+// in its arguments. Fails if there is no file, because a test that runs nothing must not pass.
 
 #include <cstdint>
 #include <cstdio>

@@ -1,5 +1,5 @@
-// Hostile bytes as a trace parameters file, from the bytes to the record. Reading ends, whatever
-// they are, and gives a record in which every trace point obeys the rules of its kind.
+// Feeds hostile bytes as a trace parameters file to everything from the bytes to the record.
+// Reading must end and give a record in which every trace point obeys the rules of its kind.
 
 #include <cstdint>
 #include <cstdlib>
@@ -18,7 +18,7 @@ void require(bool condition) {
   if (!condition) std::abort();
 }
 
-// Every file holds the bytes of this run.
+// Every file contains the bytes of this run.
 class BytesPropertyListService final : public platform::PropertyListService {
  public:
   void setBytes(std::span<const std::uint8_t> bytes) {
@@ -34,7 +34,7 @@ class BytesPropertyListService final : public platform::PropertyListService {
                                        std::optional<platform::Error>& error) const override {
     auto root = lists_.parse(bytes, error);
     require(root.has_value() != error.has_value());
-    // What the bounds of the bytes let through must not have been deeper after all.
+    // Bytes that pass the check of the shape must not turn out deeper than its bound.
     require(!error.has_value() || error->description.find("turned out") == std::string::npos);
     return root;
   }
@@ -85,7 +85,7 @@ void check(const TraceParams& params) {
   }
 }
 
-// The services stay: the parser's log category is made once.
+// The services are kept: the parser makes its log category only once.
 void read(std::span<const std::uint8_t> bytes) {
   static platform::FakePlatform& fakes = *new platform::FakePlatform;
   static BytesPropertyListService& lists = *new BytesPropertyListService;

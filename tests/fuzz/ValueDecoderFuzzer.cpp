@@ -1,5 +1,5 @@
-// Hostile bytes as a message. The first byte chooses how the rest is used: as a whole frame, or as
-// the body of one with a signature from a list, in either byte order.
+// Feeds hostile bytes to the message decoder. The first byte selects how the others are used: as a
+// whole frame, or as a body with a signature from a list, in either byte order.
 
 #include <array>
 #include <cstdint>
@@ -26,11 +26,11 @@ void require(bool condition) {
   if (!condition) std::abort();
 }
 
-// What is taken may cost this much more memory than it had bytes on the wire. The worst is a
-// dictionary of one entry, with room for four, in some 16 bytes.
+// Decoded values may use this much more memory than their bytes on the wire. The worst case is a
+// dictionary of one entry, which has room for four, in some 16 bytes.
 constexpr std::size_t kMaxGrowth = 24;
 
-// Everything that was decoded can be shown, and written and read again with the same result.
+// Everything that was decoded can be printed, and written and read again with the same result.
 void checkValues(const Frame& frame, const std::vector<Value>& arguments) {
   std::size_t memory = 0;
   for (const Value& argument : arguments) {
@@ -43,7 +43,7 @@ void checkValues(const Frame& frame, const std::vector<Value>& arguments) {
   std::string written;
   const CallTarget target{{}, "/o", {}, "m"};
   if (!appendMethodCall(written, 1, target, frame.header.signature, arguments)) {
-    return;  // what nests nearly to the limit can be read but not written
+    return;  // values nested almost to the limit can be read but not written
   }
   const auto again = readFrame(std::as_bytes(std::span(written)));
   require(std::holds_alternative<Frame>(again));
@@ -75,7 +75,7 @@ void readWhole(std::span<const std::byte> bytes) {
     require(!std::get<WireError>(result).message.empty());
   }
   const FrameMeasure measure = measureFrame(bytes, kMaxMessageBytes);
-  // A frame with something behind it, as a read buffer has it.
+  // A frame with other bytes after it, as in a read buffer.
   if (measure.state == FrameMeasure::State::kKnown && measure.totalBytes < bytes.size()) {
     const auto first = readFrame(bytes.first(measure.totalBytes));
     if (const auto* frame = std::get_if<Frame>(&first)) decode(*frame);
@@ -89,7 +89,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   using namespace halvox::platform::linux_::dbus;
   if (size == 0) return 0;
   const std::uint8_t mode = data[0];
-  // The rest on a boundary of its own, so that sanitizers see its exact end.
+  // The rest in a block of its own, so that sanitizers see its exact end.
   const std::vector<std::uint8_t> rest(data + 1, data + size);
   const auto bytes = std::as_bytes(std::span(rest));
   if (mode % 16 == kSignatures.size()) {

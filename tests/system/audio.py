@@ -17,7 +17,7 @@ PRIVATE_PIPEWIRE = Path(__file__).resolve().parents[2] / "scripts/lib/private-pi
 
 
 def missing():
-    """Why real audio cannot be tested here; empty when it can."""
+    """Why real audio cannot be tested on this machine; empty if it can."""
     if not REPORTER.exists():
         return f"{REPORTER} is not built"
     check = subprocess.run([PRIVATE_PIPEWIRE, "check"], capture_output=True, text=True)
@@ -63,7 +63,7 @@ class Audio:
         path = self.directory / f"tone-{seconds}.wav"
         if path.exists():
             return path
-        # A whole number of waves, again and again.
+        # A whole number of periods, so that the tone can be repeated without a step.
         period = rate // math.gcd(rate, pitch)
         wave_form = struct.pack(f"<{period}h", *(int(16000 * math.sin(2 * math.pi * pitch * i / rate))
                                                  for i in range(period)))
@@ -76,7 +76,7 @@ class Audio:
         return path
 
     def run(self, *command):
-        # In the scratch directory: pw-profiler leaves plots where it runs.
+        # In the scratch directory, because pw-profiler leaves plots in its working directory.
         return subprocess.Popen(command, env=self.environment, cwd=self.directory,
                                 stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL)
 
@@ -85,7 +85,7 @@ class Audio:
 
 
 class Reporter:
-    """The built reporter, between a private PipeWire and a service."""
+    """The built reporter, connected to a private PipeWire and a service."""
 
     _numbers = itertools.count()
 
@@ -107,7 +107,7 @@ class Reporter:
         return self.log_path.read_text(errors="replace")
 
     def voluntary_switches(self):
-        """How often its threads went to sleep so far: each is one wake-up."""
+        """How often its threads have gone to sleep so far: each time is one wake-up."""
         total = 0
         for status in Path(f"/proc/{self.process.pid}/task").glob("*/status"):
             for line in status.read_text().splitlines():

@@ -1,6 +1,6 @@
 """Runs the built service in a scratch directory and talks to it with clients that are not ours.
 
-Everything that is started here is stopped here, by process id. Waiting is always for a named
+Everything that is started here is stopped here, by process ID. Waiting is always for a named
 condition with a deadline.
 """
 
@@ -31,19 +31,20 @@ BUS_NAME = "com.tarno.halvox.reporting"
 OBJECT = "/com/tarno/halvox/reporting"
 UPTIME_EVENT = "com.tarno.halvox.hvreportingclientuptime"
 INTERFACE = "com.tarno.halvox.HVReportingServiceProtocol"
-# Whatever ends a test, also a time-out that kills it, ends what it started.
+# Whatever ends a test, even a time-out that kills it, ends what the test has started.
 WITH_US = ["setpriv", "--pdeathsig", "KILL", "--"]
-# Seconds. A sanitized service reads a million events back in most of a minute on a slow machine.
+# Seconds. On a slow machine a sanitized service needs most of a minute to read a million events back.
 DEADLINE = 240.0 if os.environ.get("HALVOX_SANITIZE") else 30.0
 
-NOBODY = 65534  # another user than whoever runs the tests
+NOBODY = 65534  # a user other than the one who runs the tests
 
 PLAYBACK = 4
 START, STOP = 1, 2
 
 
 def wait_for(what, condition, deadline=DEADLINE, pause=0.01):
-    """Waits until condition() is true and returns its value; fails naming what was awaited."""
+    """Waits until condition() is true and returns its value. Fails with the name of what was
+    awaited."""
     end = time.monotonic() + deadline
     while True:
         value = condition()
@@ -69,7 +70,7 @@ def stop_process(process, signal_number=signal.SIGTERM, deadline=DEADLINE):
 
 @contextlib.contextmanager
 def as_user(uid):
-    """What happens within is done as that user, who is in the group of the same number only."""
+    """Runs the body as that user, whose only group is the one of the same number."""
     groups = os.getgroups()
     os.setgroups([])
     os.setegid(uid)
@@ -83,12 +84,13 @@ def as_user(uid):
 
 
 def setpriv_to(uid):
-    """A command line's beginning: the rest runs as that user and ends with us."""
+    """The beginning of a command line that runs the rest as that user. The program ends with this
+    process."""
     return ["setpriv", "--pdeathsig", "KILL", f"--reuid={uid}", f"--regid={uid}", "--clear-groups", "--"]
 
 
 class NotifySocket:
-    """Where the service says READY=1, as it does for systemd."""
+    """Where the service reports READY=1, as it does to systemd."""
 
     def __init__(self, directory):
         self.path = str(Path(directory) / "notify")
@@ -96,7 +98,7 @@ class NotifySocket:
             os.unlink(self.path)
         self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_DGRAM)
         self._socket.bind(self.path)
-        os.chmod(self.path, 0o666)  # a service of another user says it too
+        os.chmod(self.path, 0o666)  # a service of another user reports it too
 
     def wait_ready(self, process, log_path, deadline=DEADLINE):
         end = time.monotonic() + deadline
@@ -124,14 +126,14 @@ class Service:
         self.database = self.directory / "state" / "halvox.db"
         self.config = self.directory / "halvox.toml"
         self.log_path = self.directory / "service.log"
-        # Tests add tables of their own; the two that every test needs are put together here.
+        # Tests add tables of their own. The two that every test needs are written here.
         self.config.write_text(
             f'[listener]\nsocket = "{self.socket}"\nbus = "{bus}"\n{listener}'
             + ("" if "[storage]" in config else f'[storage]\ndirectory = "{self.directory / "state"}"\n')
             + config
         )
         self._environment = {
-            # The terminal that the tests are run from may have been started by a bus.
+            # The terminal that the tests run in may have been started by a bus.
             **{key: value for key, value in os.environ.items() if not key.startswith("DBUS_STARTER_")},
             "HALVOX_CONFIG": str(self.config),
             "XDG_RUNTIME_DIR": str(self.directory),
@@ -186,11 +188,11 @@ class Service:
         return Client.to_socket(self.address)
 
     def events(self):
-        """The recorded messages in order, as (name, payload) pairs; none before the first commit."""
+        """The recorded messages in order, as (name, payload) pairs. None before the first commit."""
         return [event for event in self.all_events() if event[0] != UPTIME_EVENT]
 
     def all_events(self):
-        """The same with the events that the service records when a client leaves."""
+        """The same, with the events that the service records when a client disconnects."""
         if not self.database.exists():
             return []
         with contextlib.closing(sqlite3.connect(f"file:{self.database}?mode=ro", uri=True)) as database:
@@ -201,7 +203,7 @@ class Service:
         return wait_for(f"{count} events", lambda: len(found := self.events()) >= count and found)
 
     def wait_for_payload(self, matches):
-        """The first recorded payload that matches, once there is one."""
+        """Waits for a recorded payload that matches, and returns the first."""
         return wait_for("a recorded payload",
                         lambda: next((payload for _, payload in self.events() if matches(payload)), None))
 
@@ -215,7 +217,7 @@ class Service:
         return len(os.listdir(f"/proc/{self.process.pid}/task"))
 
     def voluntary_switches(self):
-        """How often the threads of the service went to sleep so far: each is one wake-up."""
+        """How often the threads of the service have gone to sleep so far: each time is one wake-up."""
         total = 0
         for status in Path(f"/proc/{self.process.pid}/task").glob("*/status"):
             for line in status.read_text().splitlines():
@@ -225,7 +227,7 @@ class Service:
 
 
 class Follower:
-    """A halvoxctl that shows stored records as they come, one JSON object a line."""
+    """A halvoxctl that follows the store and prints one JSON object a line."""
 
     def __init__(self, service, command):
         words = [command] if isinstance(command, str) else command
@@ -236,17 +238,17 @@ class Follower:
         self._bytes = b""
 
     def so_far(self):
-        """All records that have been shown by now."""
+        """All records that have been printed so far."""
         self._bytes += self._process.stdout.read() or b""
         return [json.loads(line) for line in self._bytes.decode().split("\n")[:-1]]
 
     def records(self, count):
-        """All records so far, once there are that many."""
+        """Waits for that many records and returns all so far."""
         return wait_for(f"{count} records",
                         lambda: len(shown := self.so_far()) >= count and shown)
 
     def leave(self):
-        """Reads no more; the exit status with which the program ends then."""
+        """Stops reading. Returns the exit status with which the program then ends."""
         self._process.stdout.close()
         return self._process.wait(DEADLINE)
 
@@ -277,7 +279,7 @@ class Client:
             self.connection.close_sync(None)
 
     def call(self, member, signature="", *arguments, path=OBJECT, interface=INTERFACE):
-        """One request; its answer as Python values, or GLib.Error."""
+        """Sends one request. Returns its answer as Python values or raises GLib.Error."""
         reply = self.connection.call_sync(
             self._destination, path, interface, member,
             GLib.Variant(f"({signature})", arguments) if signature else None,
@@ -287,7 +289,7 @@ class Client:
         return values[0] if len(values) == 1 else values or None
 
     def call_later(self, member, signature="", *arguments):
-        """One request whose answer is looked at later."""
+        """Sends one request. The caller looks at its answer later."""
         pending = Pending()
         self.connection.call(
             self._destination, OBJECT, INTERFACE, member,
@@ -330,7 +332,7 @@ class Client:
 
 
 class Pending:
-    """An answer that is still to come; `place` tells which of several came first."""
+    """An answer that may not have arrived. `place` is its position among several answers."""
 
     _places = itertools.count()
 
@@ -392,8 +394,11 @@ def to_variant(value):
 
 @contextlib.contextmanager
 def private_bus(configuration=None, options=(), environment=None, open_to_all=False):
-    """A message bus of our own; gives its address. The configuration is what stands in its file
-    besides the address and the rules, by default the usual one of a session."""
+    """A message bus of our own. Yields its address.
+
+    `configuration` is the text of its configuration file without the address and the rules; by
+    default that of a session bus.
+    """
     directory = tempfile.mkdtemp(prefix="halvox-bus-")
     source = ["--session", f"--address=unix:path={directory}/bus"]
     if configuration is not None or open_to_all:
@@ -424,7 +429,7 @@ def private_bus(configuration=None, options=(), environment=None, open_to_all=Fa
 
 
 def require(*tools):
-    """Skips a test when a program that it needs is not installed."""
+    """Skips the test if a program that it needs is not installed."""
     for tool in tools:
         if shutil.which(tool) is None:
             raise unittest.SkipTest(f"{tool} is not installed")

@@ -1,8 +1,8 @@
-"""A machine of their own for tests that meet LTTng: without privileges, and without root's tracer.
+"""Isolates tests that use LTTng: they run without privileges and cannot see root's tracer.
 
-LTTng's directories are per user, root's are the machine's own, and every traced program also
-registers with root's daemon. So these tests are never root, and where the system permits it they do
-not see root's daemon either: whether it records or hangs then makes no difference.
+LTTng has one directory for each user. Root's is the machine's own, and every traced program also
+registers with root's daemon. These tests therefore never run as root. Where the system permits it,
+they do not see root's daemon either; whether it records or hangs makes no difference then.
 """
 
 import atexit
@@ -18,7 +18,7 @@ import unittest
 from pathlib import Path
 
 BIN = Path(os.environ.get("HALVOX_BIN", Path(__file__).parents[2] / "build/dev/bin")).resolve()
-# What these tests run of the build, and what that needs beside itself.
+# The programs of the build that these tests run, and the files that those need.
 PROGRAMS = ("halvox-reportingd", "halvoxctl", "halvox-tracer-keeper", "halvox-kdebug-lttng.so",
             "halvox_kdebug_probe", "halvox_trace_client")
 NOBODY = 65534
@@ -29,17 +29,17 @@ _CLONE_NEWUSER = 0x10000000
 _MS_REC = 0x4000
 _MS_PRIVATE = 1 << 18
 
-_directory = BIN  # of the programs that are run
+_directory = BIN  # contains the programs that are run
 _is_entered = False
 
 
 def program(name):
-    """Where a program of the build is that this user may run."""
+    """The path of a program of the build that this user may run."""
     return _directory / name
 
 
 def enter():
-    """Gives up being root and hides root's tracer, both for good.
+    """Gives up being root and hides root's tracer, both for the rest of the process.
 
     Skips the module if its traces could end up in the daemon of somebody else.
     """
@@ -68,7 +68,7 @@ def _is_open_to_others(directory):
 
 
 def _share_programs():
-    """Has temporary files where others may read them, and copies of the programs if need be."""
+    """Puts temporary files where other users may read them, and copies programs if necessary."""
     global _directory
     candidates = [Path(tempfile.gettempdir()), Path("/tmp"), Path("/var/tmp")]
     base = next((path for path in candidates if path.is_dir() and _is_open_to_others(path)), None)
@@ -80,7 +80,7 @@ def _share_programs():
     atexit.register(shutil.rmtree, scratch, ignore_errors=True)
     if _is_open_to_others(BIN):
         return
-    # A build below somebody's home, such as root's own.
+    # The build may be below a home directory that others cannot enter, such as root's.
     _directory = scratch / "bin"
     _directory.mkdir()
     for name in PROGRAMS:
@@ -105,7 +105,7 @@ def _copy_libraries(path):
 
 
 def _hide_tracer():
-    """Covers the directory of root's daemon, for this process and what it starts, if it may."""
+    """Hides the directory of root's daemon from this process and its children, if permitted."""
     uid, gid = os.getuid(), os.getgid()
     libc = ctypes.CDLL(None, use_errno=True)
     if libc.unshare(_CLONE_NEWNS | (_CLONE_NEWUSER if uid != 0 else 0)) != 0:
@@ -117,7 +117,7 @@ def _hide_tracer():
             Path("/proc/self/gid_map").write_text(f"{gid} {gid} 1")
     if libc.mount(b"none", b"/", None, _MS_REC | _MS_PRIVATE, None) != 0:
         return False
-    # All of /run, because a daemon that starts later makes its directory there.
+    # Hide all of /run, because a daemon that starts later makes its directory there.
     return libc.mount(b"tmpfs", b"/run", b"tmpfs", 0, b"mode=755") == 0
 
 

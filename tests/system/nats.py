@@ -1,4 +1,4 @@
-"""Real NATS servers of our own on loopback, and the programs that drive and read the link."""
+"""Real NATS servers of our own on loopback, and the programs that use and read the link."""
 
 import base64
 import binascii
@@ -18,7 +18,7 @@ from harness import BIN, DEADLINE, WITH_US, stop_process, wait_for
 
 DRIVER = BIN / "halvox_link_driver"
 READER = BIN / "halvox_stream_reader"
-LONG_DEADLINE = 2 * DEADLINE  # for what takes seconds on an idle machine
+LONG_DEADLINE = 2 * DEADLINE  # for an operation that takes seconds on an idle machine
 
 
 def free_ports(count):
@@ -69,7 +69,7 @@ class Server:
         return (self.directory / "log").read_text(errors="replace")
 
     def pause(self):
-        """From now on it answers nothing, until it is killed or resumed."""
+        """From now on the server answers nothing, until it is killed or resumed."""
         self.process.send_signal(signal.SIGSTOP)
 
     def resume(self):
@@ -80,7 +80,7 @@ class Server:
         self.process.wait(DEADLINE)
 
     def lose_files(self):
-        """The next start finds no streams."""
+        """Deletes the streams; the server must not be running."""
         shutil.rmtree(self.directory / "store")
 
     def stop(self):
@@ -98,7 +98,7 @@ class Server:
 
 
 class NatsKey:
-    """A key pair of Ed25519 in the text forms that NATS has for it. Needs openssl."""
+    """A key pair of Ed25519 in the text forms that NATS uses. Needs openssl."""
 
     KINDS = {"operator": 14 << 3, "account": 0, "user": 20 << 3}
     SEED = 18 << 3
@@ -108,13 +108,14 @@ class NatsKey:
         self._path = Path(directory) / f"{kind}-{next(_numbers)}.der"
         self._openssl("genpkey", "-algorithm", "ed25519", "-outform", "DER", "-out", self._path)
         public = self._openssl("pkey", "-inform", "DER", "-in", self._path, "-pubout", "-outform", "DER")
-        # Both forms end with the 32 bytes of the key itself.
+        # Both forms end with the 32 bytes of the key.
         self.public = self._text(bytes([self._kind]) + public[-32:])
         self.seed = self._text(bytes([self.SEED | self._kind >> 5, (self._kind & 31) << 3])
                                + self._path.read_bytes()[-32:])
 
     def token(self, subject, name, claims):
-        """What this key says of another, by its public text, as a signed JWT."""
+        """A signed JWT in which this key states the claims about another key, given by its public
+        text."""
         now = int(time.time())
         said = {"jti": name, "iat": now, "iss": self.public, "name": name, "sub": subject,
                 "nats": {"version": 2, **claims}}
@@ -144,7 +145,7 @@ _numbers = itertools.count()
 
 
 class Operator:
-    """Who a server trusts: an account that may use JetStream, and the users that it admits."""
+    """What a server trusts: an account that may use JetStream, and the users that it admits."""
 
     UNLIMITED = dict.fromkeys(("subs", "data", "payload"), -1)
     ACCOUNT = {**UNLIMITED, **dict.fromkeys(("imports", "exports", "conn", "leaf", "mem_storage", "disk_storage",
@@ -183,13 +184,13 @@ def cluster():
                    port=ports[index], name=f"server{index}") for index in range(3)]
 
 
-# A server's first words when it wants the handshake of TLS next.
+# The first bytes of a server that wants the TLS handshake next.
 TLS_GREETING = (b'INFO {"server_id":"silent","version":"2.9.10","proto":1,"headers":true,'
                 b'"max_payload":1048576,"tls_required":true}\r\n')
 
 
 class SilentServer:
-    """Accepts connections, perhaps greets, and says nothing more."""
+    """Accepts connections, sends a greeting if there is one, and nothing more."""
 
     def __init__(self, greeting=b"", port=0):
         self._socket = socket.create_server(("127.0.0.1", port), backlog=4096)
@@ -257,27 +258,28 @@ class Driver:
         return kind == "servers", int(milliseconds) / 1000, "".join(rest)
 
     def send(self, session, count, start=0):
-        """How many were taken and refused, and the last error."""
+        """The numbers of messages that were accepted and refused, and the last error."""
         _, taken, refused, *error = self.ask(f"send {session} {count} {start}").split(" ", 3)
         return int(taken), int(refused), "".join(error)
 
     def flush(self, session):
-        """Seconds that it took."""
+        """The seconds that it took."""
         return int(self.ask(f"flush {session}").split()[1]) / 1000
 
     def threads(self):
         return int(self.ask("threads").split()[1])
 
     def acknowledged(self):
-        """Messages that were confirmed so far, of all sessions."""
+        """The number of messages that have been confirmed so far, of all sessions."""
         return int(self.ask("acknowledged").split()[1])
 
     def wait_until_acknowledged(self, count):
-        """Until so many messages of all sessions were confirmed, so that no flush is a race."""
+        """Waits until that many messages of all sessions have been confirmed, so that no flush is a
+        race."""
         wait_for(f"{count} acknowledgements", lambda: self.acknowledged() >= count, LONG_DEADLINE, pause=0.1)
 
     def end(self):
-        """Ends it in order; then `counters` and `log` are there."""
+        """Ends it in an orderly way. Afterwards `counters` and `log` are set."""
         self.ask_later("end")
         while (line := self.answer()) != "ended":
             kind, rest = line.split(" ", 1)
@@ -292,7 +294,7 @@ class Driver:
         return self.counters
 
     def flushed(self, subject):
-        """What the log says of the flushes of that subject: (acknowledged, not acknowledged)."""
+        """The flushes of that subject in the log, as (acknowledged, not acknowledged)."""
         beginning = f"flushed {subject}: "
         lines = [line[len(beginning):].split() for line in self.log if line.startswith(beginning)]
         return [(int(words[0]), int(words[2])) for words in lines]
@@ -310,7 +312,7 @@ class Driver:
 
 
 def read_stream(url, stream="HALVOX"):
-    """What the stream holds, by a plain subscriber."""
+    """The content of the stream, read by a plain subscriber."""
     result = subprocess.run(WITH_US + [str(READER), url, stream], capture_output=True, text=True,
                             timeout=120)
     if result.returncode != 0:

@@ -2,9 +2,9 @@
 
     unshare --mount python3 -m roots_daemon hangs|records COMMAND... [-- COMMAND...]
 
-Needs root and a mount namespace of its own, in which it covers /run. Tells as JSON, in the last line
-of standard output, the commands' exit statuses, how many connections the daemon that hangs got
-before and during the commands, and which sessions the one that records has afterwards.
+Needs root and a mount namespace of its own, in which it hides /run. The last line of standard
+output is JSON with the commands' exit statuses, the number of connections to the daemon that hangs
+before and during the commands, and the sessions of the daemon that records afterwards.
 """
 
 import json
@@ -23,7 +23,8 @@ RUN = Path("/run/lttng")
 
 
 class HangingDaemon:
-    """Accepts on the sockets of root's daemon, with that one's permissions, and never answers."""
+    """Accepts on the sockets of root's daemon, with the permissions of the real one, and never
+    answers."""
 
     def __init__(self):
         self.connections = []
@@ -77,7 +78,7 @@ def main():
     result = {}
     if kind == "hangs":
         daemon = HangingDaemon()
-        # A traced program that is not kept from it meets it.
+        # A traced program that is not isolated connects to the daemon.
         subprocess.run([str(BIN / "halvox_trace_client"), "intervals", "1"], check=True,
                        stdout=subprocess.DEVNULL, timeout=DEADLINE,
                        env={**os.environ, "LTTNG_UST_REGISTER_TIMEOUT": "0"})

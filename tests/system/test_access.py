@@ -1,4 +1,4 @@
-"""Who may connect to the service, and who may end it."""
+"""Which users may connect to the service, and which may end it."""
 
 import contextlib
 import os
@@ -16,7 +16,7 @@ from harness import BUS_NAME, CTL, NOBODY, SERVICE, Client, Service, as_user, pr
 
 ACCESS_DENIED = "org.freedesktop.DBus.Error.AccessDenied"
 EX_UNAVAILABLE, EX_NOPERM, EX_CONFIG = 69, 77, 78
-SYSTEM_GROUP = 12  # any group that this process is not in
+SYSTEM_GROUP = 12  # any group that this process is not a member of
 
 
 class AccessTest(unittest.TestCase):
@@ -26,11 +26,11 @@ class AccessTest(unittest.TestCase):
         self.addCleanup(shutil.rmtree, self.directory, True)
 
     def copy(self, program):
-        """The program where every user reaches it."""
+        """A copy of the program that every user can run."""
         return shutil.copy(program, self.directory)
 
     def service(self, user=None, **options):
-        """A service in a directory that everybody may enter."""
+        """A service in a directory that every user may enter."""
         home = Path(tempfile.mkdtemp(prefix="service-", dir=self.directory))
         home.chmod(0o755)
         if user is not None:
@@ -41,7 +41,8 @@ class AccessTest(unittest.TestCase):
         return service
 
     def system_service(self, **options):
-        """One that does not live in a login's directory, so that everybody may connect by default."""
+        """A service that is not in the directory of a login, so that every user may connect by
+        default."""
         return self.service(environment={"XDG_RUNTIME_DIR": ""}, **options)
 
     def connect(self, service, user=None):
@@ -141,7 +142,7 @@ class WhoMayConnect(AccessTest):
         self.assertEqual(self.mode(service.socket), 0o666)
 
     def test_the_user_alone_to_a_service_in_a_login_s_directory(self):
-        service = self.service().start()  # XDG_RUNTIME_DIR is where its socket is
+        service = self.service().start()  # the socket is in XDG_RUNTIME_DIR
 
         self.assertEqual(self.mode(service.socket), 0o600)
 

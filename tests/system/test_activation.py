@@ -1,4 +1,4 @@
-"""A service that D-Bus starts is found on the bus that started it, as the packaged files have it."""
+"""A service that D-Bus starts is found on the bus that started it, as the packaged files demand."""
 
 import contextlib
 import os
@@ -21,7 +21,7 @@ BUS = "org.freedesktop.DBus"
 
 
 def shipped_unit():
-    """What the D-Bus service file has systemd start."""
+    """The unit that the D-Bus service file lets systemd start."""
     name = re.search(r"^SystemdService=(.+)$", SERVICE_FILE.read_text(), re.MULTILINE)[1]
     return name, (PACKAGING / "systemd" / name).read_text()
 
@@ -37,20 +37,21 @@ class Activation(unittest.TestCase):
         (self.directory / "run").mkdir(mode=0o700)
 
     def environment(self):
-        """That of a login in which nothing is configured; both buses are the test's own."""
+        """The environment of a login without any configuration. Both buses are the test's own."""
         return {"HOME": str(self.directory), "XDG_RUNTIME_DIR": str(self.directory / "run"),
                 "XDG_CONFIG_HOME": str(self.directory / "config"), "HALVOX_CONFIG": "",
                 "XDG_STATE_HOME": str(self.directory / "state")}
 
     @contextlib.contextmanager
     def bus(self, *options):
-        """A bus that knows the service by the packaged file, with the path of the built program."""
+        """A bus that knows the service from the packaged file, with the path of the built program."""
         services = self.directory / "services"
         services.mkdir()
         text = SERVICE_FILE.read_text()
         self.assertIn("Exec=/usr/bin/halvox-reportingd\n", text)
-        # Its parent is a process of the bus that does not outlive the start, so it cannot be told to
-        # end with it. If the test is killed, the service ends by itself all the same.
+        # Its parent is a process of the bus that ends after the start, so the service cannot be
+        # made to end with its parent. If the test is killed, the service ends by itself all the
+        # same.
         command = f"{shutil.which('timeout')} 120 {SERVICE}"
         (services / SERVICE_FILE.name).write_text(text.replace("/usr/bin/halvox-reportingd", command))
         configuration = (f"<servicedir>{services}</servicedir>"
@@ -69,7 +70,7 @@ class Activation(unittest.TestCase):
             Gio.DBusCallFlags.NONE, int(harness.DEADLINE * 1000), None).unpack()
 
     def stop_owner(self, client):
-        """Ends the service that the bus started, which is nobody's child."""
+        """Ends the service that the bus started; it is not a child of the test."""
         pid, = self.call_bus(client, "GetConnectionUnixProcessID", "s", BUS_NAME)
         os.kill(pid, signal.SIGTERM)
         wait_for("the end of the service", lambda: not Path(f"/proc/{pid}").exists())
@@ -88,7 +89,7 @@ class Activation(unittest.TestCase):
             self.stop_owner(client)
 
     def test_a_bus_that_leaves_starting_to_systemd_is_joined_too(self):
-        """The test stands for systemd: it starts the unit's command in the unit's environment."""
+        """The test stands for systemd: it runs the unit's command in the unit's environment."""
         unit_name, unit = shipped_unit()
         with self.bus("--systemd-activation") as address:
             systemd = self.connect(address)
@@ -114,7 +115,7 @@ class Activation(unittest.TestCase):
             self.assertEqual(call.wait(), [])
 
     def test_a_program_started_by_another_bus_serves_its_socket_all_the_same(self):
-        """As from a terminal that a bus has started: the bus is gone, or the name is taken."""
+        """As from a terminal that a bus has started, when that bus has ended or the name is taken."""
         environment = {"DBUS_STARTER_ADDRESS": f"unix:path={self.directory}/no-bus",
                        "DBUS_STARTER_BUS_TYPE": "session"}
         with Service(environment=environment) as service:

@@ -31,7 +31,7 @@ class BridgesTest(unittest.TestCase):
             return store.execute(query).fetchall()
 
     def rows(self, query, count):
-        """The rows of a query on the store, once there are that many."""
+        """Waits for that many rows of a query on the store, and returns them."""
         rows = wait_for(f"{count} rows of {query}",
                         lambda: len(found := self.stored(query)) >= count and found)
         self.assertEqual(len(rows), count)
@@ -73,7 +73,7 @@ class BridgesTest(unittest.TestCase):
         follower = self.follow("metrics")
         self.assertEqual(follower.records(1)[0]["fields"],
                          {"issue_type": "glitch", "node": "one", "rtaid_client": "x", "duration": 3})
-        # Each of these is only sent when what was sent before has been shown.
+        # Each message is sent only after the effect of the one before has been seen.
         for shown, node in enumerate(("two", "three"), 2):
             send(node)
             records = follower.records(shown)

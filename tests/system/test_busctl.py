@@ -1,4 +1,4 @@
-"""busctl, systemd's command-line client, goes through the protocol and finds its way around."""
+"""busctl, systemd's command-line client, uses the whole protocol and can introspect it."""
 
 import subprocess
 import unittest
@@ -32,7 +32,7 @@ class Busctl(unittest.TestCase):
         for member, arguments, expected in (
             ("createReportingSession", ("x", "5"), "b true"),
             ("setServiceType", ("qx", "3", "5"), "b true"),
-            ("getServiceNameForReporterID", ("x", "5"), "q 65535"),  # a new connection: 5 has gone
+            ("getServiceNameForReporterID", ("x", "5"), "q 65535"),  # a new connection: session 5 has ended
             ("setConfiguration", ("a{sv}x", "1", "HostApplicationDisplayID", "s", "me", "5"), "b true"),
             ("startReportingSessionForID", ("x", "5"), "b true"),
             ("sendMessage", ("a{sv}uqaax", "1", "volume", "d", "0.5", "4", "1", "1", "1", "5"), ""),

@@ -1,4 +1,4 @@
-"""What PipeWire's sinks counted while a session ran, from a real PipeWire to the store."""
+"""What PipeWire's sinks count during a session reaches the store, with a real PipeWire."""
 
 import contextlib
 import json
@@ -15,9 +15,9 @@ from harness import Service, require, stop_process, wait_for
 SINK = "demo-speakers_Speaker_PipeWire_"
 GENERIC = 1
 SECONDS = 5
-# The thread that follows PipeWire, as the kernel shows it.
+# The name of the thread that follows PipeWire, as the kernel shows it.
 THREAD = "halvox-pipewire"
-# PipeWire tells of cycles in batches, at least one in that many seconds.
+# PipeWire reports cycles in batches, at least one batch in this number of seconds.
 BATCH = 1.0
 
 
@@ -33,7 +33,8 @@ class DriverStatisticsTest(unittest.TestCase):
         stack.callback(self.client.close)
 
     def start_service(self):
-        # It finds PipeWire where a user's programs do; its socket is elsewhere, named in full.
+        # The service finds PipeWire where a user's programs do. Its own socket is elsewhere and has
+        # a full path.
         runtime = self.audio.environment["XDG_RUNTIME_DIR"]
         return self.stack.enter_context(Service(environment={"XDG_RUNTIME_DIR": runtime}))
 
@@ -46,7 +47,8 @@ class DriverStatisticsTest(unittest.TestCase):
         self.client.create(reporter)
         self.client.set_type(GENERIC, reporter)
         self.client.configure({"test": "driver statistics"}, reporter)
-        # Answered at the session's end; what is asked next is answered once it has started.
+        # The answer comes when the session ends. The next answer shows that the session has
+        # started.
         self.client.start_later(reporter)
         self.assertTrue(self.client.valid(reporter))
 
@@ -75,16 +77,16 @@ class DriverStatisticsTest(unittest.TestCase):
         wait_for("the last cycles to be told", lambda: self.wake_ups_during(1.5 * BATCH) == 0)
 
     def cycle_length(self, player):
-        """The seconds of a cycle while the player runs, as PipeWire's own tool measures them."""
+        """The seconds of a cycle while the player runs, measured with PipeWire's own tool."""
         log = self.audio.directory / "profiler.log"
         profiler = self.audio.run("pw-profiler", "-o", log)
         self.assertEqual(player.wait(30), 0)
         stop_process(profiler)
-        # The fourth column is what the clock says, in microseconds.
+        # The fourth column is the clock, in microseconds.
         return float(log.read_text().splitlines()[0].split("\t")[3]) / 1e6
 
     def wake_ups(self):
-        """How often the thread that follows PipeWire went to sleep so far."""
+        """How often the thread that follows PipeWire has gone to sleep so far."""
         for task in Path(f"/proc/{self.service.process.pid}/task").iterdir():
             if (task / "comm").read_text().strip() == THREAD:
                 status = (task / "status").read_text()
@@ -104,7 +106,7 @@ class DriverStatisticsTest(unittest.TestCase):
         start = time.monotonic()
         length = self.cycle_length(self.play(SECONDS))
         self.wait_for_sink("idle", "suspended")
-        # On a busy machine cycles are missed, and a playback takes longer than its sound.
+        # A busy machine misses cycles, and a playback then takes longer than its sound.
         longest = time.monotonic() - start
         self.wait_until_all_is_told()
         self.end_session(1)
@@ -120,7 +122,7 @@ class DriverStatisticsTest(unittest.TestCase):
         self.check_link()
 
     def check_link(self):
-        """The same went through the session to the real-time link."""
+        """The same message was sent to the real-time link."""
         query = "SELECT type, payload FROM link_messages WHERE category = 12"
 
         def sent():
@@ -141,10 +143,10 @@ class DriverStatisticsTest(unittest.TestCase):
         smallest, greatest = (int(part.split("=")[1]) for part in head.split(","))
         parts = [re.fullmatch(r"(\d+)-(\d+):(\d+)", part).groups() for part in buckets.split(";")]
         lower, upper, hits = zip(*((int(number) for number in part) for part in parts))
-        # The first cycle of a node has no times, and one that was missed may have none.
+        # The first cycle of a node has no times, and a missed one may have none.
         self.assertLessEqual(sum(hits), cycles, text)
         self.assertGreaterEqual(sum(hits), cycles - 2 - xruns, text)
-        # The last bucket is open: no more is known of what is in it than where it begins.
+        # The last bucket is open: only its lower bound is known.
         highest = lower[-1] if upper[-1] == 9223372036854775807 else upper[-1]
         self.assertEqual((smallest, greatest), (lower[0], highest), text)
 
@@ -155,8 +157,8 @@ class DriverStatisticsTest(unittest.TestCase):
                       r"name:(\w+),transition:(\d+),residency:(\d+),duty_cycle:([\d.]+);", text)}
         transitions, residency, duty = states["running"]
         self.assertEqual(transitions, 1, text)
-        # The sink told its state and the profiler its cycles: two accounts of one time, apart from
-        # cycles that a busy machine missed.
+        # The state comes from the sink and the cycles from the profiler: two independent measures
+        # of the same time. They differ by the cycles that a busy machine missed.
         self.assertGreaterEqual(residency, 0.95 * seconds, text)
         self.assertLessEqual(residency, 1.05 * longest, text)
         total = sum(state[1] for state in states.values())
@@ -168,7 +170,7 @@ class DriverStatisticsTest(unittest.TestCase):
         self.start_session(1)
         self.end_session(1)
 
-        # The state is told all the same.
+        # The state is reported all the same.
         self.assertIn(SINK + "State_state", self.wait_for_statistics("State"))
         self.assertEqual(self.statistics("Simple"), [])
         self.assertEqual(self.statistics("Histogram"), [])
@@ -200,7 +202,7 @@ class DriverStatisticsTest(unittest.TestCase):
         self.end_session(3)
         both = self.wait_for_statistics("Simple", 3)[SINK + "Simple_cycles"]
 
-        # However long the playbacks took here.
+        # However long the playbacks took on this machine.
         self.assertGreater(min(first, second), 0)
         self.assertEqual(both, first + second)
 

@@ -1,4 +1,5 @@
-"""What drivers report as text files: shown by `halvoxctl drivers`, and sent at a session's end."""
+"""Counters that drivers write to text files are shown by `halvoxctl drivers` and sent at a
+session's end."""
 
 import contextlib
 import json
@@ -20,7 +21,7 @@ def configuration(directory):
 
 
 def write(directory, text):
-    """As a daemon should: the file is there as a whole or not at all."""
+    """Writes as a daemon should: the file appears complete or not at all."""
     new = directory / "haptics.prom.new"
     new.write_text(text)
     new.rename(directory / "haptics.prom")
@@ -75,11 +76,11 @@ class DriversCommandTest(unittest.TestCase):
     def test_watching_shows_the_change_per_second_until_nobody_reads(self):
         write(self.directory, pulses(1000))
         command = self.watch("0.05")
-        # From the first line on, every change is in some line.
+        # After the first line, every change is in some line.
         self.assertEqual(json.loads(command.stdout.readline())["value"], 0)
         write(self.directory, pulses(1600))
 
-        # As often as it takes, but each change once: what the lines tell adds up.
+        # The number of lines may vary, but each change is in one of them: their sum is exact.
         changes = []
         wait_for("600 pulses to be told", lambda: changes.append(
             (line := json.loads(command.stdout.readline()))["value"] * line["seconds"])

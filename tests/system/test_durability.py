@@ -1,4 +1,4 @@
-"""What was answered is kept, whatever kills the service afterwards."""
+"""Whatever was answered is kept, however the service is killed afterwards."""
 
 import contextlib
 import json
@@ -18,7 +18,7 @@ import harness
 from harness import Client, Service, wait_for
 
 
-# So many messages are answered more than half a second before the kill.
+# This number of messages is answered more than half a second before the kill.
 OWED = 1000
 
 
@@ -76,7 +76,7 @@ class Durability(unittest.TestCase):
                          [(run, number) for run in range(2) for number in range(100)])
 
     def fill(self, service, megabytes):
-        """Puts events of earlier runs into the database of a service that is not running."""
+        """Puts events of earlier runs into the database of a service that does not run."""
         payload = json.dumps({"text": "x" * 8000})
         with contextlib.closing(sqlite3.connect(service.database)) as database:
             with database:
@@ -127,7 +127,7 @@ class Durability(unittest.TestCase):
 
 
 def send_until_the_end(address):
-    """Sends numbered messages, one after the other, and prints when each was answered."""
+    """Sends numbered messages, one after the other, and prints the time of each answer."""
     client = Client.to_socket(address)
     client.create(1)
     number = 0

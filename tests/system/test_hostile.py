@@ -1,4 +1,4 @@
-"""Bad input gets a clear error or a closed connection; no other client notices."""
+"""Bad input gets a clear error or a closed connection, and no other client notices."""
 
 import os
 import resource
@@ -32,7 +32,7 @@ class Hostile(unittest.TestCase):
         self.log_before = len(self.service.log())
 
     def tearDown(self):
-        """The client that behaved noticed nothing."""
+        """Checks that the well-behaved client noticed nothing."""
         self.assertIs(self.bystander.send({"calm": 1}, reporters=[1000]), None)
         self.assertFalse(self.pending.done)
         self.assertIs(self.bystander.stop(1000), True)
@@ -71,7 +71,8 @@ class Hostile(unittest.TestCase):
             except ConnectionResetError:
                 pass
 
-    # --- requests that are wrong in a way that can be answered -----------------------------------
+    # --- requests with a mistake that can be answered
+    # -----------------------------------------------
 
     def test_unknown_member_interface_and_object(self):
         client = self.client()
@@ -95,7 +96,7 @@ class Hostile(unittest.TestCase):
             with self.subTest(signature=signature):
                 with self.assert_error(INVALID_ARGS, "culprit", signature):
                     self.client().send({"fine": signature, "culprit": value}, reporters=[1000])
-                # What was stored before this fence is all that came of the refused message.
+                # Whatever the refused message caused was stored before this fence.
                 self.bystander.send({"fence": signature}, reporters=[1000])
                 self.service.wait_for_payload(lambda payload: payload.get("fence") == signature)
                 taken = [payload for _, payload in self.service.events()
@@ -153,7 +154,8 @@ class Hostile(unittest.TestCase):
         client.stop(60)
         self.assertIsNone(client.send({"number": 1}, reporters=[60]))
 
-    # --- bytes that are no D-Bus -------------------------------------------------------------------
+    # --- bytes that are not D-Bus
+    # ------------------------------------------------------------------
 
     def test_garbage_instead_of_a_handshake(self):
         raw = self.raw(authenticated=False)
@@ -165,7 +167,7 @@ class Hostile(unittest.TestCase):
         with self.assertRaises(OSError):
             raw.sendall(b"\0AUTH " + b"A" * 1_000_000)
             self.assert_closed(raw)
-            raise ConnectionResetError  # closed quietly: as good
+            raise ConnectionResetError  # closing the connection quietly is also correct
 
     def test_garbage_instead_of_a_message(self):
         raw = self.raw()
@@ -227,11 +229,11 @@ class Hostile(unittest.TestCase):
 
 
 class Stalling(unittest.TestCase):
-    """Connections that stop half-way are closed in time, and logged."""
+    """Connections that stop half-way are closed in time, and that is logged."""
 
     def setUp(self):
         self.service = Service()
-        # Shorter than a person would set, so that the test need not wait.
+        # Shorter than the default, so that the test need not wait.
         text = self.service.config.read_text().replace(
             "[listener]\n", "[listener]\nhandshake_seconds = 1\nmessage_seconds = 1\n")
         self.service.config.write_text(text)
@@ -258,7 +260,7 @@ class Stalling(unittest.TestCase):
                 raw = self.stalled(data)
                 while raw.recv(4096):
                     pass
-                # The last line about a client; the log is written behind the service.
+                # The last line about a client. The log is written later than the answers are sent.
                 wait_for("the client's end in the log",
                          lambda: "dealloc" in self.service.log()[before:])
                 closing = [line for line in self.service.log()[before:].splitlines()
@@ -271,7 +273,7 @@ class Stalling(unittest.TestCase):
         stalled = self.stalled(b"\0AUTH")
         while stalled.recv(4096):
             pass
-        # The time that closed the other has passed for this one too, but it owes nothing.
+        # This connection is as old as the other, but it has sent everything that it must.
         self.assertEqual(client.reporters(), [])
 
 
@@ -310,7 +312,7 @@ def cpu_ticks(pid):
 
 
 class AssertError:
-    """Expects a D-Bus error of that name whose message has the texts."""
+    """Expects a D-Bus error of that name. Its message contains the texts."""
 
     def __init__(self, test, name, texts):
         self.test, self.name, self.texts = test, name, texts
@@ -328,7 +330,8 @@ class AssertError:
         return True
 
 
-# --- frames by hand --------------------------------------------------------------------------------
+# --- frames made by hand
+# ---------------------------------------------------------------------------
 
 
 def pad(data, alignment):
@@ -359,7 +362,7 @@ def message_body(entries):
     body = struct.pack("<I", len(entries)) + b"\0" * 4 + entries
     body = pad(body, 4) + struct.pack("<I", 4)       # category
     body = body + struct.pack("<H", 1)               # type
-    return pad(body, 4) + struct.pack("<I", 0)       # no list of reporters
+    return pad(body, 4) + struct.pack("<I", 0)       # no list of reporter IDs
 
 
 def dictionary_body(key, text):

@@ -1,5 +1,4 @@
-"""A link without back-ends: the session tells so once, drops what it would have sent, and nobody else
-notices."""
+"""A link without back-ends: the session logs that once and drops its messages; nobody else notices."""
 
 import json
 import re
@@ -13,7 +12,7 @@ from nats import SilentServer, free_ports
 
 MESSAGES = 300
 REPORTER = 7
-ATTEMPT = 2  # seconds that a server that says nothing takes of an attempt
+ATTEMPT = 2  # the seconds after which an attempt to reach a silent server ends
 NO_BACKENDS = "no backends found, this session won't get sent to the server"
 FAILED = "failed to find backend"
 TIMED_OUT = "timed out waiting for backends"
@@ -24,10 +23,10 @@ def link(backend, *servers):
 
 
 def counters(service, piece):
-    """What the running service counted of a piece, by name."""
+    """The counters of a piece of the running service, by name."""
     said = len(service.log())
     service.process.send_signal(signal.SIGUSR1)
-    # Pieces come in the order of their names, so these are the last lines.
+    # Pieces are logged in the order of their names, so these are the last lines.
     wait_for("the counters", lambda: "counted snapshots, stored: " in service.log()[said:])
     return {name: int(value) for name, value
             in re.findall(rf"counted {piece}, (.*): (\d+)$", service.log()[said:], re.MULTILINE)}
@@ -48,8 +47,10 @@ class AbsentLinkTest(unittest.TestCase):
 
     @staticmethod
     def latencies(*clients):
-        """Seconds to the answers of numbered messages to the started session, for each client. They
-        take turns, so that whatever else the machine does is the same for all."""
+        """The seconds until the answers to numbered messages for the started session, by client.
+
+        The clients take turns, so that other work of the machine affects all of them alike.
+        """
         taken = [[] for _ in clients]
         for number in range(MESSAGES):
             for client, times in zip(clients, taken, strict=True):
@@ -72,7 +73,7 @@ class AbsentLinkTest(unittest.TestCase):
 
     def assert_dropped_by_the_link_alone(self, service, client):
         self.assertIs(client.stop(REPORTER), True)
-        # The summary of the session is one message more.
+        # The summary of the session is an additional message.
         counted = wait_for("the link to drop all", lambda: (
             now := counters(service, "link"))["dropped: no back-end"] == MESSAGES + 1 and now)
         self.assertEqual(counted["received"], MESSAGES + 1)
@@ -88,7 +89,7 @@ class AbsentLinkTest(unittest.TestCase):
         wait_for("the discovery to fail", lambda: FAILED in service.log())
         self.assert_dropped_by_the_link_alone(service, client)
 
-        # The back-end gives up before the session does, which is after nine seconds.
+        # The back-end gives up before the session does, which waits nine seconds.
         self.assertLess(service.log().index(NO_BACKENDS), service.log().index(FAILED))
         self.assertEqual(service.log().count(FAILED), 1)
         self.assertNotIn(TIMED_OUT, service.log())

@@ -1,4 +1,4 @@
-"""A flood of messages that wait for their second costs nobody but the client that sent it."""
+"""A flood of messages that wait for their second affects only the client that sent it."""
 
 import contextlib
 import sqlite3
@@ -17,7 +17,7 @@ LIMITS_EXCEEDED = "org.freedesktop.DBus.Error.LimitsExceeded"
 
 
 def stored(service):
-    """Who sent each stored message and its number, in the order of the store."""
+    """The sender and number of each stored message, in the order of the store."""
     if not service.database.exists():
         return []
     with contextlib.closing(sqlite3.connect(f"file:{service.database}?mode=ro", uri=True)) as database:
@@ -43,7 +43,7 @@ class LinkFlood(unittest.TestCase):
 
     @staticmethod
     def flood(client, sender, count, reporters=None, size=MIB):
-        """Sends without waiting for answers; the pending answers by number."""
+        """Sends without waiting for answers. Returns the pending answers by number."""
         lists = [] if reporters is None else [reporters]
         return [client.call_later(
             "sendMessage", "a{sv}uqaax",
@@ -51,7 +51,8 @@ class LinkFlood(unittest.TestCase):
             harness.PLAYBACK, harness.START, lists) for number in range(count)]
 
     def answered(self, pending):
-        """The numbers of those that were answered without an error; the others name the limit."""
+        """The numbers of the messages that were answered without an error. The other answers name
+        the limit."""
         harness.iterate_until("all answers", lambda: all(one.done for one in pending))
         for error in (one.error for one in pending if one.error):
             self.assertEqual(Gio.dbus_error_get_remote_error(error), LIMITS_EXCEEDED)
@@ -59,7 +60,7 @@ class LinkFlood(unittest.TestCase):
         return [number for number, one in enumerate(pending) if one.error is None]
 
     def arrived(self, service, expected):
-        """All rows, once those expected are there and whatever was sent until now has arrived."""
+        """All rows, after the expected ones and everything that was sent before has arrived."""
         fence = self.client(service)
         fence.send({"from": "fence", "number": 0})
         return wait_for("all messages and the fence", pause=0.1, condition=lambda: len(
@@ -81,7 +82,7 @@ class LinkFlood(unittest.TestCase):
     def flood_past_the_limit(self, reporters):
         service = self.service_with(f"[limits]\nclient_history_megabytes = {LIMIT}\n")
         owner, flooder, other = (self.client(service) for _ in range(3))
-        owner.create(7)  # never started: what it is sent goes out singly
+        owner.create(7)  # never started, so its messages are sent as single messages
         flood = self.flood(flooder, "flooder", FLOOD, reporters)
         others = self.flood(other, "other", OTHERS, reporters, size=1024)
 

@@ -1,4 +1,5 @@
-"""What a started session sends through the link is in the local store, in order, each once."""
+"""Messages that a started session sends through the link are in the local store, in order, each
+once."""
 
 import json
 import os
@@ -16,7 +17,7 @@ SINGLE_MESSAGES = 3000
 
 
 def link_messages(service, *arguments):
-    """What halvoxctl link shows of the service's store."""
+    """The output of halvoxctl link for the service's store."""
     shown = subprocess.run(
         [os.path.join(os.environ["HALVOX_BIN"], "halvoxctl"), "link", "--json",
          "--database", str(service.database), *arguments],
@@ -25,7 +26,7 @@ def link_messages(service, *arguments):
 
 
 def numbers_of(messages):
-    """Of the messages that the client sent; the session adds one of its own at the stop."""
+    """Of the messages that the client sent. The session adds one of its own at the stop."""
     return [message["payload"]["number"] for message in messages
             if message["type"] == harness.START]
 
@@ -61,7 +62,7 @@ class LinkLocal(unittest.TestCase):
             client = service.client()
             self.addCleanup(client.close)
             client.create(7)
-            # The first one makes the threads that all have in common.
+            # The first one creates the threads that all of them share.
             client.send({"number": -1}, event_type=harness.STOP, reporters=[7])
             wait_for("the first message", lambda: link_messages(service, "--session=-1"))
             threads = service.threads()

@@ -1,4 +1,4 @@
-"""The back-end of the real-time link against real NATS servers, read back by a plain subscriber."""
+"""The back-end of the real-time link with real NATS servers, read back by a plain subscriber."""
 
 import os
 import subprocess
@@ -14,20 +14,21 @@ from nats import (DRIVER, LONG_DEADLINE, TLS_GREETING, Driver, Operator, Server,
 SUBJECT = "halvox.playback_session"
 APIUSAGE = 12  # the service type of that name
 EX_CONFIG = 78
-# Limits in seconds of a back-end on an idle machine, and what a busy one may add. Each is far from
-# what it has to be told from: messages are given up after 30 s, a silent server after 2 s.
+# Limits in seconds for a back-end on an idle machine, and the allowance for a busy one. Each limit
+# is far from the values that it must be distinguished from: messages are given up after 30 s, a
+# silent server after 2 s.
 FLUSH_TIME = 5 + 4
 PROMPTLY = 1.5
 
 
 def balance(counters):
-    """Received messages whose fate no counter tells."""
+    """Received messages that no counter accounts for."""
     no_fates = ("received", "published again")
     return counters["received"] - sum(value for name, value in counters.items() if name not in no_fates)
 
 
 def describe_gaps(numbers):
-    """Where numbers are not those from 0 on, in order."""
+    """The places where the numbers are not consecutive from 0."""
     breaks = [(index, number) for index, number in enumerate(numbers) if index and number != numbers[index - 1] + 1]
     return f"{len(numbers)} numbers, {len(set(numbers))} of them different, breaks at {breaks[:10]}"
 
@@ -48,7 +49,7 @@ class DeliveryTest(NatsTest):
             self.assertTrue(found)
             self.assertIn(server.url, servers)
             self.assertEqual(driver.send(7, 19_000), (19_000, 0, ""))
-            # A flush has five seconds, which a slow machine needs for its last messages alone.
+            # A flush has five seconds, and a slow machine needs them for its last messages alone.
             driver.wait_until_acknowledged(18_000)
             self.assertEqual(driver.send(7, 1000, 19_000), (1000, 0, ""))
             driver.flush(7)
@@ -126,14 +127,14 @@ class DeliveryTest(NatsTest):
             driver.start(9)
             driver.found(9)
             driver.send(9, 2000)
-            counters = driver.end()  # which has three seconds
+            counters = driver.end()  # it has three seconds
 
             self.assertEqual(numbers_of(read_stream(server.url), f"{SUBJECT}.9"), list(range(2000)))
             self.assertEqual(counters["acknowledged"], 2000)
 
     def test_what_comes_after_the_end_is_refused(self):
         with Server() as server, Driver(server.url) as driver:
-            counters = driver.end()  # which sends one more
+            counters = driver.end()  # it sends one more message
 
             self.assertEqual(counters["failed: refused"], 1)
             self.assertNotIn("a message was taken after the end", driver.log)
@@ -142,7 +143,7 @@ class DeliveryTest(NatsTest):
     def _try_read(server):
         try:
             return read_stream(server.url)
-        except AssertionError:  # the stream is not made yet
+        except AssertionError:  # the stream has not been created
             return []
 
 
@@ -154,7 +155,8 @@ class FailureTest(NatsTest):
             found, seconds, _ = driver.found(1)
             self.assertFalse(found)
             self.assertLess(seconds, 9)
-            # What comes later than a second after an attempt is taken, and has another one made.
+            # A discovery that begins more than a second after an attempt uses its result and starts
+            # another attempt.
             error = wait_for("a refusal", lambda: self._refusal(driver))
             with Server(port=port):
                 driver.start(2)
@@ -243,7 +245,7 @@ class FailureTest(NatsTest):
                     server.pause()
                 for session in (1, 2):
                     self.assertEqual(driver.send(session, 1000, start)[1], 0)
-                if start == 6000:  # and now some are on their way for certain
+                if start == 6000:  # now some messages are certainly on their way
                     server.kill()
             server.start()
             driver.wait_until_acknowledged(40_000)
@@ -260,7 +262,7 @@ class FailureTest(NatsTest):
             self.assertEqual(balance(counters), 0)
 
     def test_a_message_that_no_stream_takes_is_given_up_when_its_time_is_over(self):
-        """The stream exists, but somebody made it for other subjects."""
+        """The stream exists, but somebody created it for other subjects."""
         with Server() as server:
             with Driver(server.url, extra='subject = "other"') as driver:
                 driver.start(1)
@@ -275,7 +277,7 @@ class FailureTest(NatsTest):
 
             self.assertLess(seconds, FLUSH_TIME)
             self.assertEqual(driver.flushed(f"{SUBJECT}.1"), [(0, 100)])
-            # The refusal of the first may come before the last were tried.
+            # The refusal of the first may arrive before the last were tried.
             untried = counters.get("failed: the service ended", 0)
             self.assertGreater(counters["not acknowledged"], 0)
             self.assertEqual(counters["not acknowledged"] + untried, 100)
@@ -313,7 +315,7 @@ class FailureTest(NatsTest):
 
 
 class EndTest(NatsTest):
-    """The end does not wait for servers that say nothing."""
+    """The end does not wait for servers that never answer."""
 
     def assert_ends_promptly(self, driver):
         begun = time.monotonic()
@@ -353,7 +355,7 @@ class EndTest(NatsTest):
 
 
 class ServiceTest(NatsTest):
-    """The whole service: sessions of clients end on the stream."""
+    """The whole service: messages of clients' sessions reach the stream."""
 
     @classmethod
     def setUpClass(cls):
@@ -386,7 +388,7 @@ class ServiceTest(NatsTest):
     def try_read(url):
         try:
             return read_stream(url)
-        except AssertionError:  # the stream is not made yet
+        except AssertionError:  # the stream has not been created
             return []
 
     def test_stop_flushes_the_messages_of_a_session_in_order(self):
@@ -457,33 +459,33 @@ class ClusterTest(NatsTest):
         self.follower = next(server for server in self.servers if server is not self.leader)
 
     def test_what_a_flush_called_acknowledged_survives_the_server_in_use(self):
-        """It leads the stream, too: the worst that can happen to messages on their way."""
+        """The server also leads the stream: the worst case for messages on their way."""
         self._send_and_kill(in_use=self.leader)
 
     def test_what_a_flush_called_acknowledged_survives_the_leader_behind_the_server_in_use(self):
         self._send_and_kill(in_use=self.follower)
 
     def _send_and_kill(self, in_use):
-        """Kills the leader when half of the messages are through."""
+        """Kills the leader when half of the messages have arrived."""
         with Driver(in_use.url, extra="replicas = 3") as driver:
             for session in range(1, self.SESSIONS + 1):
                 driver.start(session)
                 self.assertTrue(driver.found(session)[0])
                 driver.ask_later(f"send {session} {self.MESSAGES} 0")
                 if session == self.SESSIONS // 2:
-                    self.leader.pause()  # in the middle of them, so that some are on their way
+                    self.leader.pause()  # in the middle of the messages, so that some are on their way
                 driver.answer()
                 if session == self.SESSIONS // 2:
                     self.leader.kill()
                 driver.flush(session)
-            # What a flush did not wait for is confirmed when there is a leader again.
+            # Messages that a flush gave up waiting for are confirmed when there is a leader again.
             driver.wait_until_acknowledged(self.SESSIONS * self.MESSAGES)
             driver.end()
         records = wait_for("the stream", lambda: self._try_read(self.follower.url), LONG_DEADLINE, pause=0.5)
         self._check(driver, records)
 
     def _leader(self):
-        """The server that says so; nobody else did, the stream is new."""
+        """The server that says that it leads. No other has: the stream is new."""
         line = "JetStream cluster new stream leader for '$G > HALVOX'"
         return next((server for server in self.servers if line in server.log()), None)
 
@@ -499,12 +501,12 @@ class ClusterTest(NatsTest):
         self.assertEqual(driver.counters["acknowledged"], self.SESSIONS * self.MESSAGES)
         self.assertGreater(driver.counters["published again"], 0)
         self.assertEqual(balance(driver.counters), 0)
-        # Only the flushes of a few sessions end while nobody leads the stream.
+        # Only the flushes of a few sessions end while the stream has no leader.
         print(f"flushes reported {confirmed} of {self.SESSIONS * self.MESSAGES} as acknowledged")
         self.assertGreaterEqual(confirmed, self.SESSIONS * self.MESSAGES * 9 // 10)
 
     def _wait_until_ready(self, driver):
-        """The cluster chooses who leads before streams can be made."""
+        """The cluster elects a leader before streams can be created."""
         def ready():
             driver.start(100_000)
             return driver.found(100_000)[0]
@@ -523,7 +525,7 @@ class AbsentTest(unittest.TestCase):
 
     def test_a_service_without_the_back_end_refuses_to_start_with_it(self):
         without = BIN / "halvox_reportingd_without_nats"
-        program = without if without.exists() else SERVICE  # which is one itself in such a build
+        program = without if without.exists() else SERVICE  # in such a build, the service itself
         if not program.exists():
             raise unittest.SkipTest("no service in this build")
         directory = Path(self.enterContext(tempfile.TemporaryDirectory(prefix="halvox-link-")))
@@ -581,7 +583,8 @@ class SecurityTest(NatsTest):
                 self.assertTrue(any("no server of the link was reached" in line for line in driver.log))
 
     def assert_reached(self, is_reached, url, extra):
-        """Whether the server counts as one with these settings; gives the driver's log."""
+        """Whether the link counts the server as found with these settings. Yields the log of the
+        driver program."""
         with Driver(url, extra=extra) as driver:
             driver.start(1)
             self.assertEqual(driver.found(1)[0], is_reached)

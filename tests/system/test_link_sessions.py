@@ -11,7 +11,7 @@ import nats
 from harness import Service, wait_for
 
 MUSIC = 7  # a service type that is not traced
-SINGLE = -1  # the session ID of messages outside any session
+SINGLE = -1  # the session ID of messages outside of any session
 SUMMARY = 65535
 WAITING = "waiting to find backends"
 LIST = "list of backends"
@@ -42,7 +42,8 @@ class LinkTest(unittest.TestCase):
 
     @staticmethod
     def start(client, reporter):
-        """Creates a session, unless it is there, and starts it; the held-back answer."""
+        """Creates a session unless it exists, and starts it. Returns the answer, which is held
+        back."""
         client.create(reporter)
         client.set_type(MUSIC, reporter)
         return LinkTest.start_again(client, reporter)
@@ -50,7 +51,7 @@ class LinkTest(unittest.TestCase):
     @staticmethod
     def start_again(client, reporter):
         started = client.start_later(reporter)
-        client.valid(reporter)  # is answered after the start was carried out
+        client.valid(reporter)  # is answered after the start has been carried out
         return started
 
 
@@ -63,10 +64,10 @@ class LinkSessions(LinkTest):
         self.reporting.send({"from": reporter}, reporters=[reporter])
 
     def heard(self):
-        """Who had a message of its own stored: of everything that was sent before.
+        """The sessions of which a message was stored, among everything that was sent before.
 
-        Queues of sessions run beside each other, so only the end of the service is a fence for
-        what must not come. Whatever is to come is waited for before.
+        Queues of sessions run concurrently, so only the end of the service shows that no further
+        message comes. What is expected is awaited before.
         """
         self.service.stop()
         return {(session, payload["from"]) for session, _, payload in stored(self.service)
@@ -104,7 +105,7 @@ class LinkSessions(LinkTest):
             self.reporting.destroy(reporter)
         self.start(self.reporting, 6)
         self.say(6)
-        self.reporting.stop(6)  # gives its own place back, but those of the others stay
+        self.reporting.stop(6)  # releases its own place, but the others' remain
         self.start_again(self.reporting, 6)
         self.say(6)
         self.service.wait_for_events(4)
@@ -150,7 +151,7 @@ class LinkSessions(LinkTest):
                 if "a" in payload]
         self.assertEqual(rows, [
             (7, harness.START, "first"), (7, harness.START, "same"), (7, SUMMARY, "first,same"),
-            # Not compared with the last message of the run before, and not summed up with it.
+            # Neither compared with the last message of the previous run nor summed up with it.
             (7, harness.START, "same"), (7, harness.START, "second"), (7, SUMMARY, "same,second")])
 
 
@@ -164,7 +165,7 @@ class LinkOrder(LinkTest):
         return lines
 
     def check_order(self, config, told, outcome):
-        """The log of each start reads in the order in which one thing follows from another."""
+        """The log lines of each start are in the order of the steps."""
         service = self.service_with(config)
         client = self.client(service)
         for number in range(1, self.ROUNDS + 1):

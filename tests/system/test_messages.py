@@ -1,4 +1,4 @@
-"""What becomes of messages: which events are wanted, what repeats, and what a session sums up."""
+"""What happens to messages: which events are wanted, which repeat, and what a session sums up."""
 
 import contextlib
 import json
@@ -19,7 +19,7 @@ STAMPS = {"hvreporting_timestamp", "systemuptime_sec", "processuptime_ms"}
 
 class MessagesTest(unittest.TestCase):
     def started(self, config="", service_type=None):
-        """A service and a client of it with a started session 7."""
+        """A service, and a client with a started session 7."""
         stack = contextlib.ExitStack()
         self.addCleanup(stack.close)
         service = stack.enter_context(Service(config))
@@ -33,7 +33,7 @@ class MessagesTest(unittest.TestCase):
 
     @staticmethod
     def link_messages(service):
-        """What went through the link of session 7, as (category, type, payload)."""
+        """The messages of session 7 on the link, as (category, type, payload)."""
         if not service.database.exists():
             return []
         with contextlib.closing(
@@ -43,14 +43,14 @@ class MessagesTest(unittest.TestCase):
         return [(category, event_type, json.loads(payload)) for category, event_type, payload in rows]
 
     def summary(self, service):
-        """The summary event, which is the last that a stop sends."""
+        """The summary event, which is the last message of a stop."""
         def last():
             return next((payload for category, event_type, payload in self.link_messages(service)
                          if (category, event_type) == (NO_CATEGORY, UNKNOWN)), None)
         return wait_for("the summary event", last)
 
     def values_through_link(self, service):
-        """Of all messages before the summary event: their category, type and value."""
+        """Category, type and value of all messages before the summary event."""
         self.summary(service)
         return [(category, event_type, payload["value"])
                 for category, event_type, payload in self.link_messages(service)
@@ -67,7 +67,7 @@ class UptimeEventTest(MessagesTest):
         with Service(config) as service:
             before = time.monotonic()
             client = service.client()
-            client.reporters()  # is answered when the client has been registered
+            client.reporters()  # is answered after the client has been registered
             registered = time.monotonic()
             wait_for("a quarter of a second", lambda: time.monotonic() > registered + 0.25)
             closing = time.monotonic()
@@ -79,7 +79,7 @@ class UptimeEventTest(MessagesTest):
         self.assertEqual(set(events[0]), {"processName", "seconds"})
         self.assertEqual(events[0]["processName"], Path("/proc/self/comm").read_text().rstrip("\n"))
         self.assertIsInstance(events[0]["seconds"], float)
-        # The wall clock, which the service measures with, is not the one here.
+        # The service uses the wall clock, not this one.
         self.assertGreaterEqual(events[0]["seconds"], closing - registered - 0.05)
         self.assertLessEqual(events[0]["seconds"], after - before + 0.05)
 
@@ -109,7 +109,7 @@ class WantedTest(MessagesTest):
         client.stop(7)
         self.assertEqual(self.values_through_link(service),
                          [(PLAYBACK, START, 1), (PLAYBACK, STOP, 2), (VOLUME, START, 3)])
-        service.stop()  # nothing is on its way any more
+        service.stop()  # no message is on its way any more
         return [name for name, _ in service.events()]
 
     def test_all_events_are_recorded_when_all_are_wanted(self):
@@ -134,7 +134,7 @@ class SuppressionTest(MessagesTest):
             client.send({"value": value}, PLAYBACK, START, [7])
         client.stop(7)
 
-        # Only the last message counts: what comes back after another is no repeat.
+        # Only the last message counts: the same content after another message is not a repeat.
         self.assertEqual([value for _, _, value in self.values_through_link(service)], [1, 2, 1])
         events = [payload["value"] for name, payload in service.wait_for_events(10)
                   if name == "com.tarno.halvox.Playback.Start"]
@@ -185,7 +185,7 @@ class SummaryEventTest(MessagesTest):
             "device": "speaker,a,b",
             "sample_rate": "48000",
             "gain": "0.5",
-            "audiotag": "UndefinedUnknown",  # its own: it is a message as others are
+            "audiotag": "UndefinedUnknown",  # the session's own message, which counts like any other
         })
         for key, text in stamps.items():
             values = [float(one) for one in text.split(",")]

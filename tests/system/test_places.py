@@ -1,8 +1,8 @@
-"""Every program finds the service and its store by one rule: what was named, else the user's, else the
-system's.
+"""Every program finds the service and its store by one rule: the named place, else the user's, else
+the system's.
 
-The system's places are fixed, so the clients here run in a mount namespace in which /run and /var/lib
-lead to the scratch directory. The services run outside of it.
+The system's places are fixed. The clients therefore run in a mount namespace in which /run and
+/var/lib lead to the scratch directory. The services run outside of it.
 """
 
 import json
@@ -21,7 +21,7 @@ IN_NAMESPACE = ["unshare", "-rm", "--", "sh", "-c",
                 'mount --bind "$1" /run && mount --bind "$2" /var/lib && shift 2 && exec "$@"', "sh"]
 SYSTEM_SOCKET = "/run/halvox/reporting.sock"
 SYSTEM_STORE = "/var/lib/halvox/halvox.db"
-# A program that has the client library only, as an audio application does. Lives until its input ends.
+# A program with the client library only, like an audio application. Ends when its input ends.
 APPLICATION = """
 import ctypes, sys
 library = ctypes.CDLL(sys.argv[1])
@@ -93,7 +93,7 @@ class Places(unittest.TestCase):
             listener.bind(str(self.user_socket))
 
     def create_and_list(self, number):
-        """What a connection with a session of this number sees."""
+        """What a connection that has a session with this number can see."""
         script = self.directory / "script"
         script.write_text(f"create {number}\nlist\n")
         return self.ctl("run", str(script))

@@ -1,4 +1,4 @@
-"""Work that nobody waits for runs at a lower scheduling priority than requests."""
+"""Work that nobody waits for has a lower scheduling priority than requests."""
 
 import unittest
 from pathlib import Path
@@ -22,7 +22,7 @@ class Priorities(unittest.TestCase):
         with Service() as service:
             client = service.client()
             self.addCleanup(client.close)
-            client.send({"number": 1})  # goes out as a single message
+            client.send({"number": 1})  # is sent as a single message
             client.create(7)
             client.set_type(MUSIC, 7)
             client.start_later(7)
@@ -34,9 +34,9 @@ class Priorities(unittest.TestCase):
         main = next(niceness for name, niceness in found if name.startswith("halvox"))
         lower = {"pool-utility": min(main + 5, 19), "pool-background": min(main + 10, 19)}
         self.assertLessEqual(set(lower), {name for name, _ in found})
-        lower["link callbacks"] = lower["pool-utility"]  # may still be there
+        lower["link callbacks"] = lower["pool-utility"]  # may still exist
         for name, niceness in found:
-            # The store's writer and the log's are among the others: requests wait for these.
+            # The store's writer and the log's are among the others, because requests wait for them.
             self.assertEqual((name, niceness), (name, lower.get(name, main)))
 
 

@@ -1,4 +1,4 @@
-"""A client with nothing of ours goes through the whole protocol, over each way in."""
+"""A client with none of our code uses the whole protocol, over each transport."""
 
 import os
 import shutil
@@ -19,7 +19,7 @@ UNKNOWN_TYPE = 65535
 
 
 class ProtocolTests:
-    """The tests; the classes below say over which transport they run."""
+    """The tests. The classes below choose the transport."""
 
     service: Service
 
@@ -241,20 +241,20 @@ class ThroughSocketActivation(ProtocolTests, unittest.TestCase):
 
 
 def activated():
-    """The service behind systemd's own activation tool: started by the first connection."""
+    """The service started by systemd's activation tool at the first connection."""
     directory = Path(tempfile.mkdtemp(prefix="halvox-test-"))
     service = Service(directory=directory, command=[
         "systemd-socket-activate", f"--listen={directory / 'reporting.sock'}",
         "--setenv=HALVOX_CONFIG", "--setenv=XDG_RUNTIME_DIR", "--setenv=XDG_STATE_HOME",
         str(harness.SERVICE)])
     service.start(wait=False)
-    # The file is there before anybody listens on it; the tool says when.
+    # The file exists before anyone listens on it. The tool prints a line when it does.
     wait_for("the activation socket", lambda: "Listening on" in service.log())
     return service
 
 
 class Fresh:
-    """A service that one test may end."""
+    """A service that a single test may end."""
 
     def __init__(self, make=lambda: Service().start()):
         self._make = make
@@ -286,7 +286,7 @@ def hold_session(address, reporter):
     client = Client.to_socket(address)
     client.create(reporter)
     client.start_later(reporter)
-    client.valid(reporter)  # answered behind the start, so the start has been carried out
+    client.valid(reporter)  # answered after the start, so the start has been carried out
     print("started", flush=True)
     signal.pause()
 

@@ -10,7 +10,7 @@ from harness import Service, stop_process, wait_for
 
 
 def message(events, name):
-    """The payloads of the messages of that name, under the name that all services share."""
+    """The payloads of the messages with that name, under the event name that all services share."""
     return [payload for event, payload in events if event == f"com.tarno.halvox.{name}"]
 
 
@@ -38,7 +38,7 @@ class RealAudioTest(unittest.TestCase):
                 for payload in message(self.service.events(), "Volume.State")]
 
     def test_playback_is_recorded_under_both_names_with_its_volumes(self):
-        # Long enough for all that is done meanwhile; it is stopped when that is done.
+        # Long enough for everything that follows; it is stopped afterwards.
         began = time.monotonic()
         player = self.play(60, volume=0.5, role="Music")
         self.wait_for_message("Volume.State")

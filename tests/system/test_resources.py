@@ -1,4 +1,5 @@
-"""What the service takes: nothing while idle, bounded memory under a flood, and no one starved."""
+"""What the service uses: nothing while idle, bounded memory under a flood; and no client is
+starved."""
 
 import os
 import shutil
@@ -37,12 +38,12 @@ class Resources(unittest.TestCase):
         self.service.wait_for_events(40)
         settled = self.settled_switches()
 
-        time.sleep(IDLE_SECONDS)  # the quantity measured, not a wait for something
+        time.sleep(IDLE_SECONDS)  # the duration of the measurement, not a wait for an event
 
         self.assertEqual(self.service.voluntary_switches() - settled, 0)
 
     def settled_switches(self):
-        """The count once it has stood still for a second."""
+        """The count after it has not changed for a second."""
         count = self.service.voluntary_switches()
         for _ in range(30):
             time.sleep(1)
@@ -60,7 +61,7 @@ class Resources(unittest.TestCase):
         self.addCleanup(flooder.stop)
 
         under_flood = self.latencies(quiet, 300)
-        time.sleep(FLOOD_SECONDS)  # let it try to grow
+        time.sleep(FLOOD_SECONDS)  # give it time to grow
         grown = self.service.memory_kib() - memory
         flooder.stop()
 
@@ -79,7 +80,7 @@ class Resources(unittest.TestCase):
 
 
 class Flooder:
-    """Pipelines requests as fast as the socket takes them and reads no reply."""
+    """Pipelines requests as fast as the socket accepts them, and reads no reply."""
 
     def __init__(self, service):
         self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
@@ -97,7 +98,7 @@ class Flooder:
             try:
                 self.bytes_sent += self._socket.send(batch)
             except TimeoutError:
-                continue  # the service reads no more: as it should
+                continue  # the service stops reading, as it should
 
     def stop(self):
         self._stopping.set()

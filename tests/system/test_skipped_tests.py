@@ -1,4 +1,4 @@
-"""What scripts/test says of tests that were skipped."""
+"""What scripts/test prints about tests that were skipped."""
 
 import subprocess
 import tempfile

@@ -18,7 +18,7 @@ JOULEBOOK = 8
 HAPTICS = 3
 INTERNAL = "[device]\nInternalBuild = true\n"
 NOT_INTERNAL = "[device]\nInternalBuild = false\n"
-WITHIN = 10.0  # seconds, in which a capture is done
+WITHIN = 10.0  # the seconds within which a capture must end
 OWN_NAME = Path("/proc/self/comm").read_text().strip()
 
 
@@ -27,20 +27,20 @@ def report(seconds):
 
 
 def snapshots(service):
-    """The archives that are there, by name; those in work have other names."""
+    """The finished archives, by name. Unfinished ones have other names."""
     return sorted((service.directory / "state" / "snapshots").glob("*.tar.zst"))
 
 
 def answers(service):
-    """How many requests for snapshots were answered; the next one is taken in after an answer."""
+    """The number of snapshot requests that were answered. The next one is accepted after an answer."""
     return service.log().count("Response from ailmentReporter")
 
 
 def counters(service):
-    """What the running service counted of its snapshots, by name."""
+    """The counters of the running service's snapshots, by name."""
     said = len(service.log())
     service.process.send_signal(signal.SIGUSR1)
-    # Pieces come in the order of their names, so these are the last lines.
+    # Pieces are logged in the order of their names, so these are the last lines.
     wait_for("the counters", lambda: "counted snapshots, stored: " in service.log()[said:])
     return {name: int(value) for name, value
             in re.findall(r"counted diagnostics, (.+): (\d+)$", service.log()[said:], re.MULTILINE)}
@@ -138,7 +138,7 @@ class Snapshots(unittest.TestCase):
             (line for line in service.log().splitlines() if "Response from ailmentReporter" in line), None))
         self.assertIn(str(archive), line)
         self.assertIn(f"size_bytes = {archive.stat().st_size}", line)
-        # As the service measured it: from taking the request to the file that has its name.
+        # As the service measures it: from the request to the file with its final name.
         self.assertLess(float(re.search(r" seconds = ([0-9.e-]+)", line)[1]), WITHIN)
 
     def test_snapshot_is_recorded_and_followed(self):
@@ -171,8 +171,8 @@ class Snapshots(unittest.TestCase):
                 haptics = HapticsClient(service)
                 for seconds in range(20):
                     haptics.send(report(seconds))
-                # Whatever these led to would have been asked for before the last answer, and would
-                # be written at the latest when the service has ended.
+                # If these had requested a snapshot, the request would have come before the last
+                # answer, and the archive would exist at the latest when the service has ended.
                 self.assertEqual(service.stop(), 0)
                 self.assertEqual(snapshots(service), [])
                 self.assertNotIn("snapshot", service.log())
@@ -205,15 +205,15 @@ class Snapshots(unittest.TestCase):
                 most_in_work = max(most_in_work, len(list(directory.glob(".*"))))
 
         self.assertLessEqual(most_in_work, 1)
-        # A busy machine may hold up some answers, but not most.
+        # A busy machine may delay some answers, but not most of them.
         self.assertLess(sorted(waited)[len(waited) * 3 // 4], 1.0, waited)
-        # Two reports ask once; each was taken or refused, and told so.
+        # Two reports make one request. Each request was accepted or refused, and that was logged.
         counted = wait_for("an end of the last snapshot", lambda: next(
             (now for now in [counters(service)]
              if now["delivered"] + now["dropped: another in work"] == 5000), None), pause=0.2)
         self.assertEqual(counted["received"], 5000)
         self.assertGreater(counted["delivered"], 0)
-        # Requests went on while one was in work.
+        # Requests continued while a capture was running.
         self.assertGreater(counted["dropped: another in work"], 0)
         self.assertEqual(service.stop(), 0)
         self.assertEqual(len(snapshots(service)), min(counted["delivered"], 20))

@@ -1,4 +1,4 @@
-"""A start that cannot succeed says why in one line and ends with a status of its own."""
+"""A start that cannot succeed reports the reason in one line and has an exit status of its own."""
 
 import contextlib
 import os

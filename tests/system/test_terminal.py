@@ -1,4 +1,4 @@
-"""What a person at the terminal, or a script that reads along, sees of halvoxctl."""
+"""The output of halvoxctl for a person at the terminal and for a script that follows it."""
 
 import itertools
 import json
@@ -36,7 +36,7 @@ def run(*arguments, environment=None, stdin=""):
 
 
 class WithService(unittest.TestCase):
-    """A service on an internal build, in which a session has lived."""
+    """A service on an internal build in which a session has run."""
 
     def setUp(self):
         self.service = Service("[device]\nInternalBuild = true\n"
@@ -79,7 +79,7 @@ class JsonFailuresTest(unittest.TestCase):
         self.assertEqual(set(failure), {"command", "result", "error"})
         self.assertIs(failure["result"], False)
         self.assertEqual(set(failure["error"]), {"kind", "name", "message"})
-        # The same is said to a person.
+        # A person gets the same text.
         self.assertIn(failure["error"]["message"].splitlines()[0], result.stderr)
         return failure["command"], failure["error"]["kind"]
 
@@ -127,7 +127,7 @@ class JsonFailuresTest(unittest.TestCase):
 
 
 class TimesTest(WithService):
-    # As in lines and in JSON, in names of files and in payloads.
+    # In lines and in JSON, in file names and in payloads.
     PRINTED = re.compile(r"\d{4}-\d\d-\d\d[ T]\d\d:\d\d:\d\d(?:\.\d+)?(?:Z| ?[+-]\d\d:?\d\d)?"
                          r"|\d{8}-\d{6}[+-]\d{4}|\b\d{10}\.\d+\b")
 
@@ -136,7 +136,7 @@ class TimesTest(WithService):
         for command in ("events", "metrics", "power", "link", "snapshots", "summary"):
             for form in ([], ["--json"]):
                 printed |= set(self.PRINTED.findall(self.ctl(command, *form).stdout))
-        # The lines' own form, that of JSON, of summaries and of their files' names.
+        # The forms of the lines, of JSON, of summaries and of their file names.
         for form in (r"\d{4}-.*\.\d{3}$", r"\d{10}\.", r".*:\d\d \+", r"\d{8}-"):
             self.assertTrue([time for time in printed if re.match(form, time)], (form, printed))
 
@@ -153,7 +153,7 @@ class TimesTest(WithService):
         everything = self.lines("events")
         for since in ("today", "yesterday", "-5m", "5min", "-5min", "300s", "1h", "1d", "1w",
                       "2020-11-21 22:44", "2020-11-21T22:44:05+01:00", "@1600000000"):
-            # A test that runs over midnight may lose what came before it to "today" alone.
+            # A test that runs across midnight may lose its earlier records from "today".
             if since != "today":
                 self.assertEqual(self.lines("events", "--since", since), everything, since)
             self.ctl("events", "--since=" + since)
@@ -177,12 +177,12 @@ class FollowTest(WithService):
             numbers = itertools.count()
 
             def shown():
-                # Until the follower has begun, what is stored is old to it.
+                # Until the follower has begun, stored records count as old for it.
                 client.send({"news": next(numbers)}, reporters=[9])
                 return follower.so_far()
             records = wait_for("a record", shown, pause=0.1)
 
-            # Nothing of what the session in the script sent.
+            # Nothing that the session in the script sent.
             self.assertTrue(all("news" in record["payload"] for record in records), records)
 
 
@@ -225,7 +225,7 @@ class NamesTest(WithService):
         for option in ("--category", "--type", "--service"):
             offered = self.completed("link", option)
             self.assertGreater(len(offered), 10, option)
-            # All at once: any of them may match.
+            # All at the same time: any of them may match.
             self.ctl("link", *(word for name in offered for word in (option, name)))
         self.assertIn("longformaudio_session", self.completed("link", "--service"))
         self.assertEqual(self.completed("power", "--category"), [])

@@ -1,4 +1,5 @@
-"""What a session reports of drivers whose daemons write text files, to the channel and the number."""
+"""A session reports the counters that daemons write to text files, exact to the channel and the
+number."""
 
 import contextlib
 import shutil
@@ -28,7 +29,7 @@ def gauge(name, value, **more):
 
 
 def histogram(*hits):
-    """Hits up to 500, up to 1000 and above."""
+    """Buckets up to 500, up to 1,000, and an open one."""
     total, text = 0, "# TYPE latency histogram\n"
     for bound, more in zip(("500", "1000", "+Inf"), hits):
         total += more
@@ -37,7 +38,8 @@ def histogram(*hits):
 
 
 class TextfileStatisticsTest(unittest.TestCase):
-    """Each report has the witness, which grows in every session, and what else was counted."""
+    """Each report contains the witness, which grows in every session, and whatever else was
+    counted."""
 
     def setUp(self):
         stack = contextlib.ExitStack()
@@ -50,7 +52,7 @@ class TextfileStatisticsTest(unittest.TestCase):
         self.write("witness", counter("witness", self.witnessed))
 
     def write(self, name, text):
-        """As a daemon should: the file is there as a whole or not at all."""
+        """Writes as a daemon should: the file appears complete or not at all."""
         new = self.directory / f"{name}.prom.new"
         new.write_text(text)
         new.rename(self.directory / f"{name}.prom")
@@ -68,7 +70,7 @@ class TextfileStatisticsTest(unittest.TestCase):
         self.client.create(reporter)
         self.client.set_type(GENERIC, reporter)
         self.client.start_later(reporter)
-        # What is asked next is answered once it has started.
+        # The next request is answered after the session has started.
         self.assertTrue(self.client.valid(reporter))
 
     def count_witness(self):
@@ -76,7 +78,7 @@ class TextfileStatisticsTest(unittest.TestCase):
         self.write("witness", counter("witness", self.witnessed))
 
     def end_session(self, reporter=1):
-        """The simple channels that the session reports beside the witness, without their driver."""
+        """The simple channels that the session reports besides the witness, without their driver."""
         self.count_witness()
         self.client.stop(reporter)
         self.client.destroy(reporter)
@@ -169,7 +171,7 @@ class TextfileStatisticsTest(unittest.TestCase):
                 self.start_service()
                 self.start_session()
                 self.delete("level")
-                # Its start reads the drivers, without the file.
+                # Its start reads the drivers, but without the file.
                 self.start_session(2)
                 self.write("level", counter("level", value))
                 self.assertEqual(self.end_session(), {})
@@ -197,7 +199,7 @@ class TextfileStatisticsTest(unittest.TestCase):
             self.start_session()
             self.count_witness()
             self.client.stop(1)
-            # Between sessions: in none of them.
+            # Between two sessions: it is in neither of them.
             self.witnessed += 100
             self.write("witness", counter("witness", self.witnessed))
 

@@ -1,4 +1,4 @@
-"""The marks that requests and sessions leave in a trace of the system, recorded by a real LTTng."""
+"""The marks that requests and sessions leave in a system trace, recorded by a real LTTng."""
 
 import contextlib
 import os
@@ -22,7 +22,7 @@ def setUpModule():
 
 
 class MarkedService(Service):
-    """A service whose trace points a tracer's daemon of its own records."""
+    """A service whose trace points are recorded by a tracer's daemon of its own."""
 
     def __init__(self, config=""):
         super().__init__(config, command=[str(isolation.program("halvox-reportingd"))])
@@ -42,7 +42,7 @@ class MarkedService(Service):
             raise AssertionError(done.stdout + done.stderr)
 
     def start_recording(self):
-        """True once the tracer records; false when this build has no trace points."""
+        """True when the tracer records. False if this build has no trace points."""
         line = wait_for("the line about trace points",
                         lambda: re.search("trace points: (.*)", self.log()))
         if line[1] != "LTTng":
@@ -54,7 +54,7 @@ class MarkedService(Service):
         return True
 
     def marks(self):
-        """The codes of all marks in their order; each has four arguments of 0."""
+        """The codes of all marks in order. Each mark has four arguments of 0."""
         self.must("stop")
         self.must("destroy")
         shown = subprocess.run(["babeltrace2", str(self.trace)], env=self.tracer, capture_output=True,

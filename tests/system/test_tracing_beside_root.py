@@ -1,4 +1,4 @@
-"""The tests of traces pass beside a tracer's daemon of root, whatever that does, and leave it alone."""
+"""The tests of traces pass beside a tracer's daemon of root, whatever it does, and leave it alone."""
 
 import json
 import os
@@ -27,7 +27,7 @@ def setUpModule():
 
 class BesideRootsDaemonTest(unittest.TestCase):
     def run_beside(self, kind):
-        """What the module roots_daemon tells of these tests."""
+        """The report of the module roots_daemon about these tests."""
         commands = [sys.executable, "-m", "unittest", "-v", *TESTS]
         unit = BIN / "halvox_lttng_test"
         if unit.exists():

@@ -1,4 +1,4 @@
-"""The tracer's daemon that a service started ends with it, however the service ends."""
+"""The tracer's daemon that a service started ends with the service, however the service ends."""
 
 import os
 import signal
@@ -15,7 +15,7 @@ def setUpModule():
 
 class EndOfServiceTest(unittest.TestCase):
     def start_trace(self, service):
-        """A session that is traced; gives its client and the daemon with all that it started."""
+        """A traced session. Yields its client, and the daemon with all processes that it started."""
         client = start_session(service)
         daemon = service.daemon()
         self.assertTrue(is_running(daemon))
@@ -81,7 +81,7 @@ class EndOfServiceTest(unittest.TestCase):
             self.assertIn("other", service.sessions())
             self.assertTrue(is_running(processes[0]))
 
-            # The next service has it again, with the same promise.
+            # The next service takes the daemon over and keeps the same promise.
             self.assertEqual(service.lttng("destroy", "other").returncode, 0)
             service.start()
             self.assertEqual(service.daemon(), processes[0])

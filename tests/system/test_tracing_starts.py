@@ -1,4 +1,4 @@
-"""A traced session that starts holds nobody up, whatever the tracer's daemon does."""
+"""The start of a traced session delays nobody, whatever the tracer's daemon does."""
 
 import contextlib
 import select
@@ -12,9 +12,9 @@ from tracing import REPORTER, TEST, TracedService, require_tracer
 # Seconds that a start may add to the worst answer. A service that waits for its tracer adds at least
 # seven times as much.
 BOUND = 0.050
-TRIES = 5  # of which a busy machine may spoil all but one
-REQUESTS = 100  # at least, while the session starts
-STARTS_WITHIN = 5.0  # seconds; to look no further when nothing tells of the start
+TRIES = 5  # a busy machine may spoil all but one
+REQUESTS = 100  # calls at least, while the session starts
+STARTS_WITHIN = 5.0  # seconds; the measurement ends then at the latest
 
 
 def setUpModule():
@@ -23,8 +23,10 @@ def setUpModule():
 
 @contextlib.contextmanager
 def silent_daemon(service):
-    """Where the service looks for its daemon: accepts, and never answers. Gives a function that
-    returns when the service has asked."""
+    """A server in the place of the daemon that accepts and never answers.
+
+    Yields a function that returns after the service has connected.
+    """
     directory = service.home / ".lttng"
     directory.mkdir()
     with contextlib.ExitStack() as stack:
@@ -33,7 +35,7 @@ def silent_daemon(service):
         listener.listen(16)
 
         def asked():
-            """True once a connection stays open with a question in it."""
+            """True when a connection with a request in it stays open."""
             while select.select([listener], [], [], 0)[0]:
                 connection = stack.enter_context(listener.accept()[0])
                 connection.settimeout(DEADLINE)
@@ -74,7 +76,7 @@ class StartTest(unittest.TestCase):
         return worst - 2 * before
 
     def assert_others_are_answered(self, trace_type, measure):
-        """measure(service) measures one start; the least of some tries must keep to the bound."""
+        """measure(service) measures one start. The best of some tries must be within the bound."""
         added = []
         while len(added) < TRIES and min(added, default=1) > BOUND:
             with TracedService() as service:
@@ -136,7 +138,7 @@ class OrderTest(unittest.TestCase):
                 stop = client.call_later("stopReportingSessionForID", "x", REPORTER)
                 wait_for("the stop", lambda: f"ending session {REPORTER}" in service.log())
                 self.assertNotIn("Tearing down trace", service.log())
-            # The daemon has gone, and the start fails.
+            # The daemon has ended, and the start fails.
             stop.wait()
             client.close()
 

@@ -1,4 +1,4 @@
-"""How long a stream played at which volume, and the summary that internal builds keep of a session."""
+"""How long a stream played at which volume, and the session summary of internal builds."""
 
 import contextlib
 import json
@@ -15,7 +15,7 @@ from harness import CTL, Service, stop_process, wait_for
 INTERNAL = "[device]\nInternalBuild = true\n"
 DIRECTORY = "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting"
 LONGEST_NAME = 255
-# Seconds. With a sanitizer, programs take several times as long to notice a change of the volume.
+# Seconds. With a sanitizer, programs need several times as long to notice a change of the volume.
 TOLERANCE = 0.2 if not os.environ.get("HALVOX_SANITIZE") else 0.8
 
 HOSTILE_NAMES = {
@@ -38,13 +38,13 @@ HOSTILE_NAMES = {
 
 
 def summaries(service):
-    """The names of the summary files that are there."""
+    """The names of the summary files that exist."""
     directory = service.directory / "state" / "root" / DIRECTORY
     return sorted(os.listdir(directory)) if directory.exists() else []
 
 
 def files_outside(service):
-    """Every file and link below the service's directory that is no summary, and those in /tmp."""
+    """All files and links below the service's directory that are not summaries, and those in /tmp."""
     found = {os.path.join(path, name) for path, _, names in os.walk(service.directory)
              for name in names if not path.endswith(DIRECTORY)}
     return {name for name in found if "halvox.db" not in name} | {
@@ -52,7 +52,7 @@ def files_outside(service):
 
 
 def shown(service, *arguments):
-    """What halvoxctl summary prints of the service's summaries."""
+    """The output of halvoxctl summary for the service's summaries."""
     result = subprocess.run([CTL, "summary", *arguments], capture_output=True, text=True,
                             timeout=harness.DEADLINE,
                             env={**os.environ, "HALVOX_CONFIG": str(service.config)})
@@ -76,7 +76,7 @@ class PlayedVolumeTest(unittest.TestCase):
                 if event == f"com.tarno.halvox.{name}"]
 
     def control(self):
-        """A pw-cli that is already connected, so that what it is told happens at once."""
+        """A pw-cli that is already connected, so that its commands take effect at once."""
         process = subprocess.Popen(["pw-cli"], env=self.audio.environment, text=True,
                                    stdin=subprocess.PIPE, stdout=subprocess.DEVNULL,
                                    stderr=subprocess.DEVNULL)
@@ -89,15 +89,18 @@ class PlayedVolumeTest(unittest.TestCase):
         return tell
 
     def play_at_two_volumes(self, first, then, properties="{}"):
-        """A tone at 0.5 for some seconds and then at 0.25: its volume messages, and how long it
-        really was at each by this process's clock. A busy machine makes the latter longer."""
+        """A tone at volume 0.5 for some seconds and then at 0.25.
+
+        Returns its volume messages, and the time at each volume by this process's clock, which a
+        busy machine makes longer.
+        """
         tell = self.control()
         player = self.audio.run("pw-play", "--volume", "0.5", "--media-role", "Music",
                                 "--properties", properties, self.audio.tone(30))
         self.stack.callback(stop_process, player)
         state = wait_for("the stream to play", lambda: self.payloads("Volume.State"), pause=0.002)[0]
-        begun = state["hvreporting_timestamp"]  # when the service heard of it, however late it is seen here
-        time.sleep(max(begun + first - time.time(), 0))  # the quantity that is measured, no wait for something
+        begun = state["hvreporting_timestamp"]  # when the service noticed it
+        time.sleep(max(begun + first - time.time(), 0))  # what is measured, not a wait
         tell("s pw-play Props { volume: 0.25 }")
         turned = time.time()
         time.sleep(then)
@@ -133,7 +136,7 @@ class PlayedVolumeTest(unittest.TestCase):
         session = json.loads(shown(self.service, "--json"))
         self.assertEqual(session["volume_intervals"], 2)
         self.assertEqual(session["service"], "longformaudio")
-        # The session is a little longer than what was played in it.
+        # The session is a little longer than the tones in it.
         self.assertGreater(session["seconds"], sum(played) - TOLERANCE)
         self.assertLess(session["seconds"], time.time() - begun)
         self.assertIn("longformaudio", shown(self.service))

@@ -21,7 +21,7 @@ THREADS = 4
 
 
 def require_tracer():
-    """Isolates the module, and skips it when the build or the machine cannot record."""
+    """Isolates the module. Skips it if the build or the machine cannot record."""
     require("lttng-sessiond", "lttng", "babeltrace2")
     isolation.enter()
     with TracedService() as service:
@@ -38,14 +38,14 @@ POINTS = [
     interval("Shared", 0x21040010, 0x21040014),
     interval("CrossByThread", 0x21040018, 0x2104001C),
     interval("CrossByProcess", 0x21040018, 0x2104001C, "Process"),
-    # The codes beside the recorded ones, and the first and the last that are recorded.
+    # The first and the last recorded code, and the codes beside them that are not recorded.
     interval("Outside", 0x2103FFFF, 0x2104408B),
     interval("Edges", 0x21040000, 0x2104408A),
 ] + [interval(f"Own{n}", 0x21040020 + 8 * n, 0x21040024 + 8 * n) for n in range(THREADS)]
 
 
 class TracedService(Service):
-    """A service with a tracer's home of its own, in which nothing runs at first."""
+    """A service with a tracer's home of its own, in which no daemon runs at first."""
 
     def __init__(self, switch="true"):
         super().__init__(f'[features.Acoustat]\nTracing = {switch}\n[log]\nlevel = "debug"\n',
@@ -65,7 +65,7 @@ class TracedService(Service):
                           file, fmt=plistlib.FMT_BINARY)
 
     def use_only(self, **programs):
-        """Leaves the service these programs alone, each given as a shell script."""
+        """Lets the service find only these programs, each given as a shell script."""
         directory = self.directory / "programs"
         directory.mkdir()
         setpriv = WITH_US[0]
@@ -77,12 +77,12 @@ class TracedService(Service):
         self._environment["PATH"] = str(directory)
 
     def has_tracer(self):
-        """Whether this build can record traces; it says so when it has started."""
+        """Whether this build can record traces. The service logs that when it has started."""
         line = wait_for("the line about traces", lambda: re.search("traces: (.*)", self.log()))
         return "not in this build" not in line[1]
 
     def counted(self, name, piece="kernel traces"):
-        """A count of the service, as it is now."""
+        """The current value of a counter of the service."""
         before = len(self.log())
         self.process.send_signal(signal.SIGUSR1)
         found = wait_for(f"the count of {name}", lambda: re.search(
@@ -99,7 +99,7 @@ class TracedService(Service):
                     os.kill(daemon, signal.SIGKILL)
 
     def daemon(self):
-        """The process of the daemon that the service started, None when there is none."""
+        """The process ID of the daemon that the service started; None if there is none."""
         with contextlib.suppress(FileNotFoundError, IndexError):
             return int(self.note.read_text().split()[0])
         return None
@@ -109,7 +109,7 @@ class TracedService(Service):
         return json.loads(found[0].read_text()) if found else None
 
     def client_environment(self):
-        # A program waits so long for the tracer, so that nothing is emitted before it listens.
+        # Programs wait this long for the tracer, so that nothing is emitted before it records.
         return {**os.environ, **self.environment, "LTTNG_UST_REGISTER_TIMEOUT": "10000"}
 
     def run_client(self, *arguments):
@@ -124,11 +124,11 @@ class TracedService(Service):
                               text=True, timeout=DEADLINE, check=False)
 
     def sessions(self):
-        """What the tracer's daemon lists; empty when none runs."""
+        """The sessions of the tracer's daemon; empty if no daemon runs."""
         return self.lttng("list").stdout
 
     def recordings(self):
-        """The traces that record now."""
+        """The traces that record at the moment."""
         return list(self.directory.glob("state/traces/recording/*"))
 
     def scratch(self):
@@ -136,9 +136,10 @@ class TracedService(Service):
 
 
 def start_session(service, trace_type="ktrace", records=True):
-    """A session of the type test that runs; gives its client when what is emitted is recorded.
+    """A started session of the type test. Yields its client when events are recorded.
 
-    Of a session that is not to record anything, when its start has been carried out."""
+    With records=False it yields when the start has been carried out.
+    """
     client = service.client()
     configuration = {"HVReportingMeridelPlistFilePath": str(service.params)}
     if trace_type is not None:
@@ -151,17 +152,17 @@ def start_session(service, trace_type="ktrace", records=True):
 
 
 def restart_session(service, client, records=True):
-    """The same for a session that is there already."""
+    """The same for a session that exists."""
     before = service.recordings()
     client.start_later(REPORTER)
-    client.valid(REPORTER)  # is answered when the start has been carried out
+    client.valid(REPORTER)  # is answered after the start has been carried out
     if records:
         wait_for("the recording to begin", lambda: set(service.recordings()) - set(before))
 
 
 @contextlib.contextmanager
 def traced_session(service, trace_type="ktrace", records=True):
-    """The same, stopped at the end."""
+    """The same; stops the session at the end."""
     client = start_session(service, trace_type, records)
     yield client
     client.stop(REPORTER)
@@ -174,7 +175,8 @@ def wait_for_results(service):
 
 
 def is_running(pid):
-    """Whether there is such a process that has not ended; nobody may wait for an orphan here."""
+    """Whether the process exists and has not ended. An orphan that has ended may stay here as a
+    zombie."""
     try:
         return ") Z " not in Path(f"/proc/{pid}/stat").read_text()
     except FileNotFoundError:
@@ -191,7 +193,7 @@ def children_of(pid):
 
 
 def waits_for_processor(pid):
-    """How many seconds each thread of a process was ready to run, but others did."""
+    """For each thread of a process, the seconds in which it was ready to run but had to wait."""
     waits = {}
     for file in Path(f"/proc/{pid}/task").glob("*/schedstat"):
         with contextlib.suppress(FileNotFoundError, ProcessLookupError):

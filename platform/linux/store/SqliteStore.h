@@ -38,10 +38,12 @@ struct StoreOptions {
 //
 //   made --open()--> running --close()--> closed
 //
-// Any thread adds records to the kinds below. The writer commits everything that has come since
-// its last commit, and starts at once when it was idle. A record is in the database within half a
-// second after the call that added it, unless the store dropped it; killing the process later
-// cannot lose it. A power cut can lose what the last checkpoint of the log had not synced.
+// Any thread adds records to the kinds below. One thread writes: SQLite allows one writer at a
+// time, and each commit has a fixed cost that a batch shares. The writer commits everything that
+// has come since its last commit, and starts at once when it was idle. A record is in the database
+// within half a second after the call that added it, unless the store dropped it; killing the
+// process later cannot lose it. A power cut can lose what the last checkpoint of the log had not
+// synced.
 //
 // Failures never reach the callers. When the disk is full, the file is locked, or reading or
 // writing fails, the store drops and counts the records at hand, logs at most one error a second,
