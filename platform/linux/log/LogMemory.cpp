@@ -14,10 +14,10 @@ LogMemory::LogMemory(LogLevel level, Bounds bounds)
 void LogMemory::add(const LogEntry& entry, std::string_view line) {
   const MutexLock lock(mutex_);
   line = line.substr(0, bounds_.bytes);
-  // A text lies in one piece: the rest of the ring stays empty when it is too short.
+  // A text is never split: if it does not fit before the end of the ring, that rest stays unused.
   const std::uint64_t room = bounds_.bytes - end_ % bounds_.bytes;
   if (room < line.size()) end_ += room;
-  // What this text will lie over, and what lay in the part left empty, goes.
+  // Drop the lines that the new text overwrites, and those in the unused rest.
   const std::uint64_t end = end_ + line.size();
   while (firstLine_ != endLine_ &&
          (lines_[firstLine_ % bounds_.lines].begin + bounds_.bytes < end ||

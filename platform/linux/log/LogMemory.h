@@ -14,36 +14,36 @@
 
 namespace halvox::platform::linux_ {
 
-// The newest lines of the log, kept in memory for a capture of diagnostics whatever is written out.
-// Bounded in lines and in bytes; the oldest lines make room. Adding copies the line into a ring
-// that is there already: no allocation, a short lock.
-// Any thread may add and read.
+// Keeps the newest lines of the log in memory for captures of diagnostics, at a level of its own.
+// Bounded in lines and in bytes: a new line replaces the oldest. Adding a line copies it into a
+// ring that was allocated at the start, under a short lock. Threads: any may add and read. Owner:
+// the log service.
 class LogMemory {
  public:
   struct Bounds {
     std::size_t lines = 10'000;
-    std::size_t bytes = 4U << 20U;  // of the lines' texts
+    std::size_t bytes = 4U << 20U;  // of the texts
   };
   struct Contents {
     std::string text;         // the lines as a log file shows them, each with its end
     std::uint64_t lines = 0;  // in the text
-    std::uint64_t added = 0;  // ever
+    std::uint64_t added = 0;  // since the start, replaced lines included
   };
 
-  // `level`: the least level that is kept.
+  // Keeps lines of `level` and above.
   explicit LogMemory(LogLevel level) : LogMemory(level, Bounds{}) {}
   LogMemory(LogLevel level, Bounds bounds);
 
   [[nodiscard]] LogLevel level() const { return level_; }
-  // Keeps a line. `line` may be the start of a longer one of `wholeLength` bytes; what is longer
-  // than all the room is cut. The names in the entry must live as long as the log; its text is not
-  // read.
+  // Keeps `line`, which may be the start of a text of `entry.wholeLength` bytes; cuts it at
+  // `bounds.bytes`. Ignores `entry.text`. The names in the entry must live as long as the log.
   void add(const LogEntry& entry, std::string_view line);
-  // The lines kept, oldest first. Formats them without holding anybody up.
+  // The kept lines, oldest first. Copies them under the lock and formats the copies after it, so
+  // that a capture does not delay those who log.
   [[nodiscard]] Contents contents() const;
 
  private:
-  // One line: its text is at `begin` in the ring, counted on over all rounds.
+  // `begin` counts bytes since the start; the text is at `begin` modulo the size of the ring.
   struct Line {
     std::chrono::system_clock::time_point time;
     std::string_view subsystem;
@@ -57,12 +57,13 @@ class LogMemory {
   const LogLevel level_;
   const Bounds bounds_;
   mutable Mutex mutex_;
-  // Both have their addresses from the beginning, and memory as far as lines have come.
-  std::vector<Line> lines_ HALVOX_GUARDED_BY(mutex_);  // a ring once it is full
+  // Both have their full address range from the start; the kernel gives memory when lines come.
+  std::vector<Line> lines_ HALVOX_GUARDED_BY(mutex_);  // a ring, once full
   std::unique_ptr<char[]> ring_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t firstLine_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t endLine_ HALVOX_GUARDED_BY(mutex_) = 0;
-  std::uint64_t end_ HALVOX_GUARDED_BY(mutex_) = 0;  // where the next text begins
+  std::uint64_t end_ HALVOX_GUARDED_BY(mutex_) =
+      0;  // where the next text begins, counted like `begin`
 };
 
 }  // namespace halvox::platform::linux_

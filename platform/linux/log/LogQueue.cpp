@@ -5,8 +5,10 @@
 namespace halvox::platform::linux_ {
 namespace {
 
+// Bytes, with the entries: about 5,000 lines of 100 bytes. Errors may use kRoomForErrors beyond it.
 constexpr std::size_t kRoom = 1U << 20U;
-constexpr std::size_t kRoomForErrors = 256U << 10U;  // beside the other
+constexpr std::size_t kRoomForErrors = 256U << 10U;
+// Entries whose memory is kept between two batches. A burst must not hold its memory for ever.
 constexpr std::size_t kKeptCapacity = 256;
 
 }  // namespace

@@ -12,28 +12,29 @@
 
 namespace halvox::platform::linux_ {
 
-// One line on its way to the reader of the log. The names belong to the category, which lives as
-// long as the log.
+// One line on its way to the reader of the log. The category owns the names and lives as long as
+// the log.
 struct LogEntry {
   std::chrono::system_clock::time_point time;
   LogLevel level = LogLevel::kDefault;
   std::string_view subsystem;
   std::string_view category;
-  std::string text;             // as the caller gave it, its start only when it is very long
-  std::size_t wholeLength = 0;  // of what the caller gave, in bytes
+  std::string text;             // unescaped; only its start, if it is longer than kLongestLogLine
+  std::size_t wholeLength = 0;  // bytes that the caller logged
 };
 
-// Lines between those who log and the one thread that writes, bounded in bytes. When the writer
-// falls behind, new lines are refused; a part of the room is kept for errors.
-// Any thread may add; one thread takes.
+// The queue between the threads that log and the one thread that writes. Bounded in bytes: when the
+// writer falls behind, new lines are refused, and the last part of the queue takes only errors.
+// New lines rather than old ones, because the first lines of a burst usually name its cause.
+// Threads: any may add; one takes. Owner: the log service.
 class LogQueue {
  public:
-  // False when there is no room, or after the end.
+  // Returns false if the queue is full, or after end(). Never blocks for long.
   bool add(LogEntry entry);
-  // Takes all that has come; waits while there is nothing. False once the end has come and all has
-  // been taken.
+  // Replaces `entries` with all queued lines; waits while there are none. Returns false after
+  // end(), once all lines were taken.
   bool take(std::vector<LogEntry>& entries);
-  // No more lines are taken in; the taker wakes up.
+  // Refuses further lines and wakes the thread that takes.
   void end();
 
  private:

@@ -10,26 +10,29 @@
 
 namespace halvox::platform::linux_ {
 
-// Takes lines from the thread that writes the log.
+// Where log lines go. The log's thread writes; any thread may call finish().
+// Owner: the log service.
 class LogSink {
  public:
   virtual ~LogSink() = default;
-  // Writes the lines in order and returns how many of them reached the reader. May wait for the
-  // reader until finish() is called from another thread, and about a second after that.
+  // Writes the lines in order; returns how many were written. Waits for a slow reader without
+  // limit, and for about one more second after finish() was called.
   virtual std::size_t write(std::span<const LogEntry> entries) = 0;
+  // Bounds the waiting of write(). May be called during write().
   virtual void finish() = 0;
 };
 
-// Lines of text on a descriptor, which is not owned.
+// Writes lines of text to `descriptor`, which the caller keeps open and owns.
 std::unique_ptr<LogSink> makeTextLogSink(int descriptor);
 
-// What sends fields to the journal: sd_journal_sendv, or what stands for it in a test.
+// Sends the fields of one entry to the journal: sd_journal_sendv, or a substitute in a test.
+// Returns a negative number on failure.
 using JournalSender = std::function<int(const iovec* fields, int count)>;
 
-// Native journal entries. A line that the journal does not take counts as not written.
+// Writes native journal entries. A line for which `sender` fails counts as not written.
 std::unique_ptr<LogSink> makeJournalLogSink(JournalSender sender);
 
-// True when $JOURNAL_STREAM says that what is written to that descriptor goes to the journal.
+// Whether the descriptor is connected to the journal, by $JOURNAL_STREAM (see systemd.exec(5)).
 bool isJournalStream(int descriptor);
 
 }  // namespace halvox::platform::linux_

@@ -11,7 +11,7 @@
 
 namespace halvox::platform::linux_ {
 
-// One category's face of the service.
+// A category: adds its names to lines and passes them to the service.
 class QueuedLogService::Category final : public LogCategory {
  public:
   Category(QueuedLogService& service, std::string subsystem, std::string category)
@@ -101,12 +101,12 @@ void QueuedLogService::run() {
   }
 }
 
-// Not counted as received: the log says this of itself.
+// The line is not counted as received: nobody logged it.
 void QueuedLogService::reportLosses() {
   const std::uint64_t lost = unreported_.exchange(0, std::memory_order_relaxed);
   if (lost == 0) return;
   std::string text = detail::logPrefix("QueuedLogService", __LINE__) + std::to_string(lost) +
-                     " lines were dropped: the log is read too slowly";
+                     " lines were dropped: the reader of the log is too slow";
   const std::size_t length = text.size();
   const LogEntry entry{.time = std::chrono::system_clock::now(),
                        .level = LogLevel::kError,

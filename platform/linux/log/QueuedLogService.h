@@ -19,18 +19,20 @@
 
 namespace halvox::platform::linux_ {
 
-// The log of the service. Lines go through a bounded queue to a thread that formats and writes
-// them, so a slow reader of the log never holds up those who log: lines that find no room are
-// dropped and counted, errors last, and the loss is told in the log as soon as there is room.
-// Control characters in a line are escaped and very long lines are cut, since clients' texts are
-// logged. Nothing runs while nothing is logged.
+// The log of the service. A bounded queue leads to one thread that formats and writes lines, so a
+// slow reader of the log never delays the threads that log. When the queue is full, lines are
+// dropped and counted, errors last; the log reports the loss when there is room again. Lines can
+// contain texts of clients: control characters are escaped, and long lines are cut. The thread
+// sleeps while nothing is logged.
 //
-// Beside that the newest lines stay in memory at a level of their own, for captures of diagnostics.
+// The newest lines also stay in memory, at a level of their own, for captures of diagnostics.
 //
-// Any thread may log. The categories live as long as the service, which main keeps to the end.
+// Threads: any may log. Owner: the platform, until the process ends. Categories live as long as the
+// service.
 class QueuedLogService final : public LogService {
  public:
-  // The least level that is written, and the least that is kept in memory; none: nothing is kept.
+  // The least levels of lines that are written and of lines that are kept in memory. Without
+  // `kept`, none are kept.
   struct Levels {
     Levels(LogLevel toWrite) : written(toWrite) {}  // implicit: most name one
     Levels(LogLevel toWrite, LogLevel toKeep) : written(toWrite), kept(toKeep) {}
@@ -38,20 +40,20 @@ class QueuedLogService final : public LogService {
     std::optional<LogLevel> kept;
   };
 
-  // Lines below both levels are not wanted. `statistics` must outlive the service.
+  // Callers need not format lines below both levels. `statistics` must outlive the service.
   QueuedLogService(Levels levels, std::unique_ptr<LogSink> sink, StatisticsService& statistics);
-  // To standard error, or to the journal when that is where standard error goes.
+  // Writes to the journal if standard error is connected to it, otherwise to standard error.
   static std::unique_ptr<QueuedLogService> onStandardError(Levels levels,
                                                            StatisticsService& statistics);
   ~QueuedLogService() override;
 
   LogCategory& createCategory(std::string_view subsystem, std::string_view category) override;
 
-  // Writes what is waiting, for about a second at most when the reader is stuck, and ends the
-  // thread. Lines logged later are dropped and counted. May be called again.
+  // Writes the queued lines, waits about a second for a reader that does not read, and ends the
+  // thread. Later lines are dropped and counted. May be called again.
   void stop();
 
-  // The newest lines that were kept in memory.
+  // The lines kept in memory; empty without `Levels::kept`.
   [[nodiscard]] LogMemory::Contents keptLines() const;
 
  private:
@@ -62,19 +64,19 @@ class QueuedLogService final : public LogService {
   void reportLosses();
 
   const Levels levels_;
-  const std::unique_ptr<LogMemory> memory_;  // null: nothing is kept
+  const std::unique_ptr<LogMemory> memory_;  // null if no lines are kept
   const std::unique_ptr<LogSink> sink_;
   Counter& received_;
   Counter& written_;
   Counter& dropped_;
   Counter& failed_;
   LogQueue queue_;
-  // Orders with nothing: it is only told.
+  // Lost lines that no log line has reported yet. Orders nothing: it is only a number.
   std::atomic<std::uint64_t> unreported_{0};
   Mutex mutex_;
   std::map<std::pair<std::string, std::string>, std::unique_ptr<Category>> categories_
       HALVOX_GUARDED_BY(mutex_);
-  std::thread thread_;  // last: it uses all of the above
+  std::thread thread_;  // last, because it uses all members above
 };
 
 }  // namespace halvox::platform::linux_

@@ -19,13 +19,15 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-// What a pipe takes without waiting once it is ready for writing.
+// A pipe that poll(2) reports as writable accepts this many bytes without blocking (PIPE_BUF).
 constexpr std::size_t kChunk = 4096;
-// How long lines may still wait for the reader when the log ends.
+// How long the end of the service waits for a reader that does not read.
 constexpr std::chrono::milliseconds kLastWait{1000};
 
-// Waits for its reader without a time-out, so that an idle or a stuck log costs nothing; an event
-// descriptor ends the wait. Belongs to the log's thread but for finish().
+// Waits for its reader in poll(2) without a time-out: a stuck reader causes no wake-ups. finish()
+// wakes it through an event descriptor. The descriptor stays blocking, because it is shared with
+// other processes; hence poll() and short writes.
+// Threads: the log's thread; finish() from any.
 class TextLogSink final : public LogSink {
  public:
   explicit TextLogSink(int descriptor)
@@ -44,7 +46,7 @@ class TextLogSink final : public LogSink {
   const int descriptor_;
   const UniqueFd finish_;
   LogLineFormatter formatter_;
-  std::optional<Clock::time_point> deadline_;  // once the end was asked for
+  std::optional<Clock::time_point> deadline_;  // set after finish()
 };
 
 std::size_t TextLogSink::write(std::span<const LogEntry> entries) {
@@ -79,7 +81,7 @@ bool TextLogSink::waitForReader() {
     const int ready = ::poll(polled.data(), polled.size(), timeout);
     if (ready < 0 && errno == EINTR) continue;
     if (ready <= 0) return false;
-    if (polled[0].revents != 0) return true;  // an error shows when writing
+    if (polled[0].revents != 0) return true;  // write(2) reports an error
     deadline_ = Clock::now() + kLastWait;
   }
 }
