@@ -23,7 +23,7 @@ std::string inQuotes(std::string_view text) {
   return result + (taken < text.size() ? "…\"" : "\"");
 }
 
-// What stands in the file, in words.
+// Describes to the user what the file has.
 std::string found(const toml::node& node) {
   if (const auto* text = node.as_string()) return "the string " + inQuotes(text->get());
   if (const auto* number = node.as_integer()) return fmt::format("{}", number->get());
@@ -48,7 +48,8 @@ std::size_t editDistance(std::string_view left, std::string_view right) {
   return row.back();
 }
 
-// The known key that `key` is closest to. Long keys are no typing mistakes: they are not compared.
+// The known key with the smallest edit distance to `key`. Only the first bytes of `key` are
+// compared: the cost grows with its length, and a long key is not a typing mistake.
 std::string_view closest(std::string_view key, const std::vector<std::string>& known) {
   const std::string_view start = key.substr(0, kLongestQuote);
   const auto best = std::ranges::min_element(
@@ -175,7 +176,7 @@ void TableReader::readSeconds(std::string_view key, std::chrono::milliseconds& r
   const toml::node* node = find(key);
   if (node == nullptr) return;
   const std::optional<double> seconds = node->is_number() ? node->value<double>() : std::nullopt;
-  // Written so that a NaN is out of range.
+  // This form of the comparison rejects NaN.
   if (!(seconds.has_value() && *seconds >= 0.001 && *seconds <= kLongestSeconds)) {
     return expected(*node, key,
                     fmt::format("a number of seconds from 0.001 to {}", kLongestSeconds));

@@ -1,6 +1,7 @@
 #pragma once
 
-// Private to the reading of the configuration: tables of a parsed file, key by key.
+// Private to Configuration.cpp: reads the tables of a parsed file key by key. toml++ is included
+// here and not in Configuration.h, because it is large.
 
 #define TOML_HEADER_ONLY 0  // the parser is compiled once, in ConfigurationReader.cpp
 #define TOML_EXCEPTIONS 0
@@ -20,12 +21,14 @@
 
 namespace halvox::platform::linux_ {
 
-// Collects the mistakes of one file and keeps the first in its text.
+// Collects the mistakes of one file and keeps the one that comes first in the text, whatever the
+// order of the checks: users fix a file from the top.
 class ConfigurationMistakes {
  public:
   explicit ConfigurationMistakes(std::string file) : file_(std::move(file)) {}
 
-  // "FILE:LINE:COLUMN: what", made one line.
+  // Adds the mistake "FILE:LINE:COLUMN: what". Control characters are escaped, so that the error
+  // stays one line.
   void add(const toml::source_position& where, std::string_view what);
   [[nodiscard]] const std::optional<ConfigurationError>& first() const { return first_; }
 
@@ -40,11 +43,13 @@ struct NumberRange {
   std::uint64_t greatest;
 };
 
-// One table of the file. Each read names a key, so that in the end the unknown ones are known; it
-// leaves `result` alone when the key is absent or its value is not what is expected (a mistake).
+// One table of the file. Every read names its key, so that finish() can report the keys that nobody
+// read. A read leaves `result` unchanged, which holds the default, if the key is absent; and also
+// if the value is not as expected, which it adds as a mistake. Refers to the parsed file and to
+// `mistakes`, which must outlive it. Belongs to one thread.
 class TableReader {
  public:
-  // `table` may be null: an absent table, in which no key is found. `name` is empty for the root.
+  // `table` is null for a table that the file does not have. `name` is empty for the root.
   TableReader(const toml::table* table, std::string name, ConfigurationMistakes& mistakes)
       : table_(table), name_(std::move(name)), mistakes_(mistakes) {}
 
@@ -52,28 +57,28 @@ class TableReader {
   void read(std::string_view key, bool& result);
   void read(std::string_view key, std::string& result);  // not empty
   void read(std::string_view key, std::vector<std::string>& result);
-  // The same for texts of a form: `matches` tells them, `what` names them to the user. A list has
-  // at least one.
+  // Reads a text, or a list of at least one, that must satisfy `matches`; `what` describes to the
+  // user what is expected.
   using TextForm = bool (*)(std::string_view);
   void readText(std::string_view key, TextForm matches, std::string_view what, std::string& result);
   void readTexts(std::string_view key, TextForm matches, std::string_view what,
                  std::vector<std::string>& result);
-  // An absolute path of at most that many bytes; "~/" is expanded.
+  // Reads an absolute path of at most `longest` bytes; expands "~/".
   void read(std::string_view key, std::filesystem::path& result, std::size_t longest);
   void read(std::string_view key, NumberRange range, std::uint64_t& result);
   void readSeconds(std::string_view key, std::chrono::milliseconds& result);
-  // One of the names; gives its place among them.
+  // Reads one of `names`; `result` becomes its index.
   void readChoice(std::string_view key, std::initializer_list<std::string_view> names,
                   std::size_t& result);
-  // All keys, whatever they are called, with their values.
+  // Reads all keys, whatever their names.
   [[nodiscard]] Dictionary readValues();
   [[nodiscard]] std::vector<std::pair<std::string, TableReader>> readTables();
   [[nodiscard]] std::map<std::string, bool, std::less<>> readSwitches();
 
   [[nodiscard]] bool isPresent() const { return table_ != nullptr; }
-  // A mistake of that key, which is present: `what` says what was expected.
+  // Adds a mistake for `key`, if it is present; `what` describes what was expected.
   void refuse(std::string_view key, std::string_view what);
-  // Reports each key that nobody read.
+  // Adds a mistake for each key that nobody read. Call it last.
   void finish();
 
  private:

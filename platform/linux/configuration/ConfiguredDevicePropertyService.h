@@ -8,7 +8,8 @@
 
 namespace halvox::platform::linux_ {
 
-// The device properties that the configuration file sets. Never changes; any thread may ask.
+// The device properties that the configuration file sets. Immutable, hence for any thread. Owner:
+// the platform.
 class ConfiguredDevicePropertyService final : public DevicePropertyService {
  public:
   explicit ConfiguredDevicePropertyService(Dictionary properties)

@@ -8,7 +8,8 @@
 
 namespace halvox::platform::linux_ {
 
-// The feature switches that the configuration file sets. Never changes; any thread may ask.
+// The feature switches that the configuration file sets. Immutable, hence for any thread. Owner:
+// the platform.
 class ConfiguredFeatureFlagService final : public FeatureFlagService {
  public:
   explicit ConfiguredFeatureFlagService(FeatureSwitches switches)

@@ -7,12 +7,13 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Follows brackets and dots through a text, and passes over what is in quotes and comments.
+// Counts brackets and dots through a text, outside quotes and comments. Does not parse and does not
+// recurse: the text may be anything.
 class NestingScan {
  public:
   explicit NestingScan(std::string_view text) : rest_(text) {}
 
-  // How much of the text has been read when it is too deep; none when it never is.
+  // Returns the bytes read when the nesting becomes too deep; none if it never does.
   std::optional<std::size_t> find() {
     const std::size_t size = rest_.size();
     while (!rest_.empty()) {
@@ -44,13 +45,13 @@ class NestingScan {
     levels_.back() += levels;
     depth_ += levels;
   }
-  // The key or number that came last, with its dots, is done with.
+  // Ends the current key or number, whose dots no longer count.
   void forgetElement() {
     depth_ -= levels_.back();
     levels_.back() = 0;
   }
 
-  // A bracket that begins a line outside all others begins the header of a table.
+  // A bracket at the start of a line, outside all other brackets, opens a table header.
   void open(bool beginsLine) {
     if (levels_.size() == 1) {
       isHeader_ = beginsLine;
@@ -60,7 +61,7 @@ class NestingScan {
     deepen(1);
   }
 
-  // What the header adds holds for all lines below it.
+  // The levels of a header count for all lines until the next header.
   void close() {
     if (levels_.size() == 1) return;
     const std::size_t levels = levels_.back();
@@ -86,14 +87,14 @@ class NestingScan {
       skip(quote == '"' && rest_.front() == '\\' ? 2 : 1);
     }
     skip(end.size());
-    // The last quotes of three may have up to two in front of them that are text.
+    // Up to two quotes directly before the closing three belong to the text.
     for (int extra = 0; isLong && extra < 2 && rest_.starts_with(quote); ++extra) skip(1);
   }
 
   std::string_view rest_;
-  std::vector<std::size_t> levels_{0};  // of the current element in each open bracket
-  std::size_t header_ = 0;
-  std::size_t depth_ = 0;  // all of these together
+  std::vector<std::size_t> levels_{0};  // of the current element, for each open bracket
+  std::size_t header_ = 0;              // levels of the current table header
+  std::size_t depth_ = 0;               // sum of levels_ and header_
   bool isHeader_ = false;
   bool isLineStart_ = true;
 };

@@ -6,14 +6,14 @@
 
 namespace halvox::platform::linux_ {
 
-// So many levels may the tables and arrays of a file have, one in another.
+// The most levels of tables and arrays in a file. Code that walks them recurses.
 inline constexpr std::size_t kDeepestNesting = 256;
 
-// The first line, from 1 on, at which the keys, tables and arrays of a TOML text may be nested
-// deeper than that; none when they never are. The parser bounds brackets but no dots: a line of a
-// hundred thousand of them, as in "a.a.a = 1", makes as many tables, and all that walks through
-// them afterwards would run out of stack. A text that is no TOML is judged up to its first mistake
-// at least.
+// Returns the number of the first line, counted from 1, at which keys, tables and arrays may be
+// nested deeper than kDeepestNesting; none if no line is. toml++ limits the depth of brackets, but
+// not the number of dots in a key: a key such as "a.a.a" with 100,000 dots makes as many tables,
+// and code that walks them overflows the stack. In a text that is not TOML, at least the part
+// before the first mistake is checked.
 std::optional<std::size_t> lineNestedTooDeep(std::string_view text);
 inline bool isNestedTooDeep(std::string_view text) { return lineNestedTooDeep(text).has_value(); }
 
