@@ -96,7 +96,7 @@ class HVReportingServiceDelegate final
 
   // Held while a connection is prepared and while a session is looked up across clients, and
   // nowhere else. It guards no data: the list of clients and the index belong to the reporting
-  // queue. The lock and its being recursive are required all the same.
+  // queue. A recursive lock is required here all the same.
   mutable std::recursive_mutex lock_;
   Clients clients_;     // reporting queue only
   SessionIndex index_;  // reporting queue only

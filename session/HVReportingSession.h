@@ -19,7 +19,7 @@ namespace halvox {
 
 // Message keys offered to clients. The service reads neither, and this is required: no field is
 // excluded from comparisons and no message is throttled. The established names begin with "_HV",
-// which C++ reserves for itself; hence the k.
+// which C++ reserves for itself, so these begin with k.
 inline constexpr std::string_view kHVReportingSessionBlacklistFieldsKey =
     "_comparison_field_blacklist";
 inline constexpr std::string_view kHVReportingSessionThrottleSecondsKey = "_throttle_seconds";
@@ -149,7 +149,7 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
                                 const platform::Dictionary& userInfo, const ErrorReply& reply,
                                 const Account& sender = nullptr);
 
-  // The message history of the current run, and the lock of all bookkeeping of identifiers.
+  // The message history of the current run, locked. The lock also guards the counts of identifiers.
   [[nodiscard]] HistoryLock nestedAggregatedPayloadData() const { return history_.lock(); }
   // Records a message under its next identifier and returns false, or drops it as redundant and
   // returns true. The caller holds the history; if that is none, nothing is recorded and the result

@@ -14,8 +14,8 @@ inline constexpr double kHVReportingVersionNumber = 2.1;
 // The same in every user info.
 inline constexpr std::string_view kLinkClientName = "com.tarno.halvox";
 
-// What the framework learns about a session: its state at the moment of its start, whatever changes
-// before the link's start job runs.
+// The state of a session at the moment of its start, for the framework. Changes before the link's
+// start job runs do not count.
 struct LinkStart {
   AudioServiceType serviceType;
   std::string_view serviceName;  // a constant of the vocabulary

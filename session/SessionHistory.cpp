@@ -71,7 +71,7 @@ bool SessionHistory::recordLocked(const Lock& history, AudioEventCategory catego
   if (previous != nullptr && !isExemptFromSuppression(category, type) &&
       equalApartFromVolatileKeys(*previous, message)) {
     kSessionLog.debug("dropping redundant event");
-    // The history may have grown all the same: by the code under which the base is now known.
+    // Nothing was recorded, but the table of codes may have grown.
     held_.change(before, messages.memorySize());
     return true;
   }

@@ -60,8 +60,8 @@ bool mayUseFramework(AudioServiceType serviceType) {
 std::size_t bytesOf(const LinkMessage& message) {
   std::size_t bytes = kWaitingOverhead + message.tagged.memorySize();
   if (!message.original.has_value()) return bytes;
-  // The tagged message has one entry more and shares the values of the original, unless cleaning
-  // made two keys equal or replaced a tag: then some values belong to the original alone.
+  // Normally the tagged message is the original with one more entry and shares its values. If two
+  // keys became equal or the original had a tag, some values belong to the original alone.
   const bool sharesValues = message.tagged.size() == message.original->size() + 1;
   bytes += sharesValues ? message.original->size() * sizeof(Dictionary::Entry)
                         : message.original->memorySize();

@@ -46,8 +46,8 @@ Message SessionSummary::createEvent() const {
 }
 
 // Writes the text piece by piece, because a long history and its whole text may not fit into memory
-// together. So the directory is created before the text is made. Every value has a JSON text, so
-// only the file can fail.
+// together. The directory must therefore exist before the text is made. Every value has a JSON
+// text, so only the file can fail.
 void SessionSummary::writeFile() const {
   if (!HVReportingUtilityIsInternalBuild() || history_.size() == 0) return;
   platform::FileService& files = platform::files();

@@ -123,8 +123,9 @@ void SessionTracing::startFrameworkTrace(const Owner& owner) {
     state->config = std::move(config);
     state->session.swap(former);
   }
-  // The former trace still records if its stop chose the runner. It ends here, with its last
-  // holder. Without a delegate its callbacks cannot be taken for those of the new trace.
+  // The former trace still records if its stop chose the runner. It ends when this function
+  // releases it. Its delegate is removed first, so that its callbacks are not taken for those of
+  // the new one.
   if (former != nullptr) former->setDelegate({});
   trace->setDelegate(std::shared_ptr<SessionTracing>(owner, this));
   setStartedTracing(true);

@@ -50,8 +50,8 @@ class VolumeIntervals {
 };
 
 // Finds the volume messages of a history one at a time, so that the history need not stay locked
-// between them. Ignores messages that are added during the walk, because each volume message is
-// sent through the session and so added to the same history.
+// between them. Messages that are added during the walk are ignored: the session records each
+// volume message in the same history.
 //
 // Belongs to one thread. Does not hold the history, which the caller passes to each call.
 class VolumeWalk {
