@@ -280,7 +280,7 @@ std::size_t Value::memorySize() const {
       return array().memorySize();
     case Tag::kDictionary:
       return dictionary().memorySize();
-    default:  // everything that lives in place
+    default:  // kinds that are stored in the value itself
       return 0;
   }
 }

@@ -2,21 +2,21 @@
 # Helpers for our scripts: messages, background processes, and cleaning up. Source it from a bash script
 # that runs with `set -euo pipefail`.
 #
-# A script that starts processes does, before the first:
-#   halvox_make_scratch NAME          # a directory of its own, in $HALVOX_SCRATCH
-#   halvox_clean_up_on_exit           # whatever happens: processes stopped, directory removed
-# On a failure the ends of the logs in the scratch directory (*.log) are shown first.
+# A script that starts processes calls these first:
+#   halvox_make_scratch NAME          # makes a directory of its own, $HALVOX_SCRATCH
+#   halvox_clean_up_on_exit           # always stops the processes and removes the directory
+# After a failure it first prints the ends of the logs in the scratch directory (*.log).
 
 HALVOX_SCRIPT=${HALVOX_SCRIPT:-$(basename "$0")}
 HALVOX_SCRATCH=${HALVOX_SCRATCH:-}
-# The processes that are ours, oldest first, as "pid name". Each leads a process group of its own.
+# Our processes, oldest first, as "pid name". Each leads a process group of its own.
 HALVOX_PROCESSES=()
 HALVOX_STOP_SECONDS=5
 
-# One line for the person at the terminal.
+# Prints a line for the user.
 say() { printf '%s\n' "$HALVOX_SCRIPT: $*"; }
 
-# The headline of the next step.
+# Prints the title of the next step.
 step() { printf '\n==> %s\n' "$*"; }
 
 # Ends the script with a message.
@@ -29,8 +29,8 @@ fail() {
 # Returns 1 and prints WHAT after that time.
 halvox_wait_for() { halvox_wait_for_start "" "$@"; }
 
-# The same for what a process of ours does when it has started: halvox_wait_for_start PID WHAT ...
-# Gives up at once when that process has ended.
+# The same for something that a process of ours does after its start: halvox_wait_for_start PID WHAT
+# ... Returns at once if that process has ended.
 halvox_wait_for_start() {
   local pid=$1 what=$2 seconds=$3 end
   shift 3
@@ -49,9 +49,9 @@ halvox_wait_for_start() {
 }
 
 # Starts a process in the background: halvox_start NAME LOG COMMAND...
-# Sets HALVOX_PID. It gets its own process group, so that a Ctrl-C at the terminal reaches the
-# script alone, which then stops everything in order; and it ends should the script be killed.
-# Not to be called in a subshell: the process would belong to that.
+# Sets HALVOX_PID. The process gets its own process group, so that a Ctrl-C reaches only the script,
+# which then stops everything in order. It ends if the script is killed. Do not call this in a
+# subshell: the process would belong to that.
 halvox_start() {
   local name=$1 log=$2
   shift 2
@@ -62,7 +62,7 @@ halvox_start() {
 
 halvox_is_running() { kill -0 "$1" 2>/dev/null; }
 
-# Whether anything is left of the process group that a process led.
+# Whether a process of the group that this process led still exists.
 halvox_group_lives() { kill -0 -- "-$1" 2>/dev/null; }
 
 halvox_forget() {
@@ -73,7 +73,7 @@ halvox_forget() {
   HALVOX_PROCESSES=(${kept[@]+"${kept[@]}"})
 }
 
-# Waits for a process that ends by itself; returns its exit status.
+# Waits for a process that ends by itself, and returns its exit status.
 halvox_wait() {
   local status=0
   wait "$1" || status=$?
@@ -84,7 +84,7 @@ halvox_wait() {
 # Stops a process and all processes that it started: with SIGTERM, after some seconds with SIGKILL.
 halvox_stop() {
   local pid=$1 end=$((SECONDS + HALVOX_STOP_SECONDS))
-  # The group does not exist before the process has come to make it.
+  # The group exists only after the process has made it.
   kill -TERM -- "-$pid" 2>/dev/null || kill -TERM "$pid" 2>/dev/null || true
   while halvox_is_running "$pid" || halvox_group_lives "$pid"; do
     if ((SECONDS > end)); then
@@ -139,15 +139,14 @@ halvox_clean_up_on_exit() {
   trap 'exit 129' HUP
 }
 
-# How far a log says that its command has come: the last "[3/120]", as Ninja writes it.
+# The progress in a log: the last "[3/120]", as Ninja writes it.
 halvox_progress_in() {
   tail -c 4000 "$1" 2>/dev/null | grep -oE '\[[0-9]+/[0-9]+\]' | tail -n 1 || true
 }
 
-# Runs a command that takes its time: halvox_run WHAT LOG COMMAND...
-# Shows that it goes on: a spinner with the seconds at a terminal, a line every ten seconds
-# elsewhere. When it fails, shows the end of its output and returns its status. The log is only for
-# the time being.
+# Runs a command that takes long: halvox_run WHAT LOG COMMAND...
+# Shows progress: a spinner with the seconds at a terminal, a line every ten seconds elsewhere. If
+# the command fails, prints the end of its output and returns its status. The log is temporary.
 halvox_run() {
   # shellcheck disable=SC1003  # that is a backslash, no quoting
   local what=$1 log=$2 pid status=0 begin=$SECONDS told=0 ticks=0 spinner='|/-\'

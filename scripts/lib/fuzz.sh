@@ -1,5 +1,5 @@
 #!/usr/bin/env bash
-# Runs every fuzz target from its kept seeds, two at a time, sharing that many seconds of processor
+# Runs every fuzz target from its seeds, two at a time. The targets share that many seconds of CPU
 # time evenly.
 # fuzz.sh DIRECTORY-OF-TARGETS SECONDS
 set -euo pipefail

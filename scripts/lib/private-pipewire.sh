@@ -1,19 +1,19 @@
 #!/usr/bin/env bash
-# A PipeWire of our own: no hardware, no systemd, nothing shared with the desktop's.
-# One null sink ("Demo speakers", node demo-speakers) drives the graph with a real clock, so
-# streams really run; its monitor is the only source. WirePlumber links streams to it.
+# A PipeWire of our own: no hardware, no systemd, nothing shared with the desktop's. One null sink
+# ("Demo speakers", node demo-speakers) drives the graph with a real clock, so that streams really
+# run. Its monitor is the only source. WirePlumber links streams to it.
 #
 # As a program:  private-pipewire.sh check
 #   Prints the missing tools; exits with 1 if there are any.
 #                private-pipewire.sh serve DIRECTORY
-#   Prints "ready" once streams can run, then "restarted" for each line "restart" that it reads, and
-#   stops everything when its standard input ends. The environment that clients need is in
+#   Prints "ready" when streams can run, then "restarted" for each line "restart" that it reads.
+#   Stops everything when its standard input ends. The environment for clients is in
 #   DIRECTORY/environment, one NAME=value a line.
-# To be sourced, after common.sh:
+# Sourced after common.sh:
 #   halvox_audio_start DIRECTORY      # starts and waits; exports what clients need
 #   halvox_audio_stop
 #
-# DIRECTORY must be short (a socket's path has at most 107 bytes) and exist.
+# DIRECTORY must exist, and must be short: a socket's path has at most 107 bytes.
 
 HALVOX_AUDIO_TOOLS=(dbus-daemon pipewire wireplumber pw-cli pw-dump pw-play pw-record)
 
@@ -96,7 +96,8 @@ halvox_audio_enter() {
 
 halvox_audio_socket_exists() { [ -S "$1" ]; }
 
-# WirePlumber has found the sink and chosen it: from here on it links streams to it.
+# Whether WirePlumber has found the sink and made it the default: from then on it links streams to
+# it.
 halvox_audio_has_default_sink() { pw-dump | grep -q '"default.audio.sink"'; }
 
 halvox_audio_start_servers() {

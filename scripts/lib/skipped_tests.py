@@ -11,7 +11,7 @@ from pathlib import Path
 
 TEST = re.compile(r"^\d+/\d+ Test: (.*)$")
 OF_PYTHON = re.compile(r"^(\S+) \((\S+)\).* \.\.\. skipped (['\"])(.*)\3$")
-# GoogleTest writes the place and then, in lines of their own, the reason.
+# GoogleTest writes the place first, and the reason on the lines after it.
 OF_GOOGLETEST = re.compile(r"^\S+:\d+: Skipped$")
 
 

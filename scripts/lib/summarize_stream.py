@@ -8,7 +8,7 @@ Exit status 1 when there was none.
 import json
 import sys
 
-# The tag stands in a column of its own; the times are in every message.
+# The tag has a column of its own, and the times are the same in every message.
 LEFT_OUT = ("audiotag", "hvreporting_timestamp", "systemuptime_sec", "processuptime_ms")
 FIELDS = 3
 LONGEST_KEY = LONGEST_VALUE = 30  # characters

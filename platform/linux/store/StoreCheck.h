@@ -24,9 +24,9 @@ namespace halvox::platform::linux_ {
 // writer from reusing the write-ahead log. After each slice the thread pauses for the same time.
 //
 // Reads only the records that existed when the database was opened: this run has written the later
-// ones. Reports only damage. When the file cannot be read for another reason, logs an error and
-// gives up: the store notices such an error itself when it needs the page. A check that did not
-// come to its end is for the store to begin again when it opens the database the next time.
+// ones. Reports only damage. If the file cannot be read for another reason, logs an error and gives
+// up: the store notices such an error itself when it needs the page. The store repeats an
+// unfinished check when it opens the database the next time.
 //
 // Owned by the store. Only the store's own threads call begin() and stop(), one at a time.
 class StoreCheck {

@@ -25,7 +25,7 @@ SLOW_TEST = 0.4  # seconds; such tests run when all others have passed
 MEMORY_LIMIT = 8 << 30  # bytes of address space
 COMPILE_LIMIT = 300.0
 
-# Freed and fresh memory holds this byte, so that what reads it is seen.
+# The allocator fills fresh and freed memory with this byte, so that code which reads it is noticed.
 _TEST_ENVIRONMENT = {"MALLOC_PERTURB_": "165"}
 _TEST = re.compile(r"^\s*halvox_test\(\s*(\w+)", re.MULTILINE)
 

@@ -12,7 +12,7 @@ from dataclasses import dataclass
 from .mutants import mutants_of
 
 _TEST_FILE = re.compile(r"(Test|_test|Fixture)\.(h|cpp)$")
-# Makes the objects and runs them; nothing of it is linked into a unit test.
+# The composition root. No unit test links it.
 _COMPOSITION_ROOT = "service/main.cpp"
 
 NOT_COMPILED, KILLED, SURVIVED = "not compiled", "killed", "survived"
@@ -86,13 +86,13 @@ class Campaign:
         given = shares(choices, count)
 
         def one_of(choice):
-            # A mutant that does not compile is replaced by the next of its file.
+            # A mutant that does not compile is replaced by the next one of its file.
             while (mutant := choice.next()) is not None:
                 if self._record(mutant).state != NOT_COMPILED:
                     return
 
-        # One file after the other would leave the choice to the order in which jobs end; each file
-        # is one job at a time, so that a seed always gives the same mutants.
+        # Each file is one job at a time. If jobs shared a file, the order in which they end would
+        # decide which mutants are chosen, and a seed would not always give the same ones.
         def all_of(choice):
             for _ in range(given[choice.file]):
                 one_of(choice)

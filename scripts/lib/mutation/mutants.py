@@ -99,7 +99,7 @@ def _words(token, before, after):
 def _marks(text, token):
     if token.text in {"++", "--"}:
         return "arithmetic", [_ARITHMETIC[token.text]]
-    # With blanks around it a mark is an operator of two values, not a type's.
+    # A mark between blanks is an operator of two values, not part of a type.
     spaced = text[token.start - 1] in " \n" and text[token.end:token.end + 1] in (" ", "\n")
     if token.text == "!":
         return "negation", [""]
@@ -152,7 +152,7 @@ def _of_conditions(source):
             continue
         closing = source.partners[opening]
         inside = tokens[opening + 1:closing]
-        # What declares something cannot be put into brackets.
+        # A declaration cannot be put into brackets.
         if any(one.text in {"=", ";"} for one in inside) or not inside:
             continue
         start, end = inside[0].start, inside[-1].end

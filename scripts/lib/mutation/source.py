@@ -26,7 +26,7 @@ _JUMPS = {"return", "break", "continue", "throw", "goto", "co_return"}
 _DECLARING = {"const", "constexpr", "static", "auto", "using", "struct", "class", "enum", "union",
               "typedef", "thread_local", "template", "friend", "static_assert", "public", "private",
               "protected", "unsigned", "signed", "mutable", "explicit", "virtual", "inline"}
-# What stands before the brace of a block of statements, rather than of a list or of a class.
+# What comes before the brace of a block of statements, as opposed to that of a list or a class.
 _BEFORE_BLOCK = {")", "else", "do", "try", "const", "noexcept", "override", "mutable"}
 
 
@@ -81,7 +81,7 @@ class Source:
         before = self.tokens[index - 1]
         if before.text in _BEFORE_BLOCK:
             return True
-        # A block for its own sake, and what follows a label or the members a constructor makes.
+        # A block of its own, and one after a label or a constructor's member initialisers.
         nested = any(first < index < last for first, last in blocks)
         return before.text == "}" or (nested and before.text in {";", "{", ":"})
 

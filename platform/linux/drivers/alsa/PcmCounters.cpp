@@ -8,7 +8,7 @@ void PcmCounters::look(const PcmStatus& status, Clock::time_point now) {
         std::chrono::duration_cast<std::chrono::microseconds>(now - lastTime_);
     if (last_->state != status.state) ++states_[status.state].transitions;
   }
-  // A new stream has another owner, or its pointer is behind the old one.
+  // A new stream has another owner or a lower pointer.
   const bool isNewStream =
       !last_.has_value() || last_->owner != status.owner || status.hardwareFrames < hardware_.last;
   count(hardware_, status.hardwareFrames, isNewStream);

@@ -94,9 +94,9 @@ std::optional<StoreError> EventFollower::deliverBy(Read read) {
   return error;
 }
 
-// Opens the database that took the place of the old one; its record IDs start from 1. `isOpen` is
-// false while there is none. A database that is still being created can fail in any way, so an
-// error counts only when no look remains.
+// Opens the database that replaced the old one; its record IDs start from 1. `isOpen` is false
+// while there is none. A database that is still being created can fail in any way, so an error
+// counts only after the last look.
 std::optional<StoreError> EventFollower::reopen(bool& isOpen) {
   auto error = reader_.open(directory_);
   isOpen = !error.has_value();
