@@ -1,19 +1,17 @@
 #include "platform/linux/configuration/Configuration.h"
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
 #include <cstdlib>
 #include <limits>
 
-#include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/un.h>
 #include <unistd.h>
 
 #include "platform/linux/base/ErrnoText.h"
-#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/base/Utf8.h"
+#include "platform/linux/base/WholeFile.h"
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
 #include "platform/linux/configuration/ConfigurationReader.h"
 #include "platform/linux/configuration/TomlNesting.h"
@@ -51,29 +49,28 @@ ConfigurationError unreadable(const std::filesystem::path& file, int error) {
                               errnoText(error)))};
 }
 
-// The file's text; none when there is no such file.
+// The file's text; none when there is no such file. It may be a pipe, such as the one that a shell
+// makes of <(command). Opening one does not block: a pipe that nobody writes to must not hold up
+// the start.
 std::variant<std::optional<std::string>, ConfigurationError> readText(
     const std::filesystem::path& file) {
-  // Opening does not block, so that a pipe nobody writes to cannot hold up the start.
-  const UniqueFd descriptor(::open(file.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK));
-  if (!descriptor) {
-    if (errno == ENOENT || errno == ENOTDIR) return std::nullopt;
-    return unreadable(file, errno);
+  FileContent content =
+      readWholeFile({.path = file.c_str(), .most = kLargestFile, .kinds = FileToRead::Kinds::kAny});
+  switch (content.outcome) {
+    case FileContent::Outcome::kRead:
+      return std::move(content.bytes);
+    case FileContent::Outcome::kMissing:
+      return std::nullopt;
+    case FileContent::Outcome::kTooLarge:
+      return ConfigurationError{
+          ConfigurationError::Kind::kWrong,
+          oneLine(fmt::format("{}:1:1: the file: expected at most {} bytes, found more",
+                              file.native(), kLargestFile))};
+    case FileContent::Outcome::kNotRegular:
+    case FileContent::Outcome::kFailed:
+      break;
   }
-  ::fcntl(descriptor.get(), F_SETFL, 0);
-  std::string text;
-  std::array<char, 16'384> buffer;
-  while (text.size() <= kLargestFile) {
-    const ssize_t count = ::read(descriptor.get(), buffer.data(), buffer.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return unreadable(file, errno);
-    if (count == 0) return text;
-    text.append(buffer.data(), static_cast<std::size_t>(count));
-  }
-  return ConfigurationError{
-      ConfigurationError::Kind::kWrong,
-      oneLine(fmt::format("{}:1:1: the file: expected at most {} bytes, found more", file.native(),
-                          kLargestFile))};
+  return unreadable(file, content.error);
 }
 
 bool isNotEmpty(std::string_view text) { return !text.empty(); }

@@ -1,7 +1,6 @@
 #include "platform/linux/runtime/LibcClockService.h"
 
 #include <algorithm>
-#include <array>
 #include <charconv>
 #include <cmath>
 #include <cstdint>
@@ -9,10 +8,9 @@
 #include <optional>
 #include <string_view>
 
-#include <fcntl.h>
 #include <unistd.h>
 
-#include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/base/WholeFile.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -43,12 +41,11 @@ std::optional<std::int64_t> startTicks(std::string_view stat) {
 
 std::chrono::nanoseconds ownStart() {
   const std::chrono::nanoseconds now = read(CLOCK_BOOTTIME);
-  const UniqueFd file(::open("/proc/self/stat", O_RDONLY | O_CLOEXEC));
-  std::array<char, 1024> buffer;
-  const ssize_t count = file ? ::read(file.get(), buffer.data(), buffer.size()) : -1;
+  const FileContent stat =
+      readWholeFile({.path = "/proc/self/stat", .most = 1024, .excess = FileToRead::Excess::kCut});
   const std::int64_t ticksPerSecond = ::sysconf(_SC_CLK_TCK);
-  if (count <= 0 || ticksPerSecond <= 0) return now;
-  const auto ticks = startTicks({buffer.data(), static_cast<std::size_t>(count)});
+  if (stat.bytes.empty() || ticksPerSecond <= 0) return now;
+  const auto ticks = startTicks(stat.bytes);
   if (!ticks.has_value()) return now;
   const std::chrono::nanoseconds tick =
       std::chrono::nanoseconds(std::chrono::seconds(1)) / ticksPerSecond;

@@ -1,14 +1,12 @@
 #include "platform/linux/runtime/ProcfsProcessService.h"
 
-#include <array>
 #include <cerrno>
 #include <string_view>
 
-#include <fcntl.h>
 #include <unistd.h>
 
-#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/base/Utf8.h"
+#include "platform/linux/base/WholeFile.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -18,12 +16,11 @@ constexpr std::size_t kLongestName = 15;
 // The name in a `comm` file: everything except the newline that the kernel appends. A name may
 // contain any character but NUL, newlines and parentheses included.
 std::optional<std::string> readCommandName(const std::string& path) {
-  const UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (!file) return std::nullopt;
-  std::array<char, 128> buffer;  // names of kernel threads are longer than those of processes
-  const ssize_t count = ::read(file.get(), buffer.data(), buffer.size());
-  if (count <= 0) return std::nullopt;
-  std::string_view name(buffer.data(), static_cast<std::size_t>(count));
+  // Names of kernel threads are longer than those of processes.
+  const FileContent file =
+      readWholeFile({.path = path.c_str(), .most = 128, .excess = FileToRead::Excess::kCut});
+  if (file.bytes.empty()) return std::nullopt;
+  std::string_view name = file.bytes;
   if (name.ends_with('\n')) name.remove_suffix(1);
   return replaceInvalidUtf8(name.substr(0, kLongestName));
 }

@@ -1,16 +1,12 @@
 #include "platform/linux/settings/PreferenceFile.h"
 
-#include <array>
-#include <cerrno>
+#include <cstdint>
 #include <limits>
-
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
+#include <utility>
 
 #include "platform/linux/base/ErrnoText.h"
-#include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/base/Utf8.h"
+#include "platform/linux/base/WholeFile.h"
 #include "platform/linux/configuration/TomlNesting.h"
 #include "platform/linux/settings/SettingNames.h"
 #include "platform/linux/settings/TomlValues.h"
@@ -31,36 +27,29 @@ PreferenceFileError problem(const std::filesystem::path& file, int error) {
   return problem(file, ": cannot read the preferences: " + errnoText(error));
 }
 
-PreferenceFileError tooLarge(const std::filesystem::path& file, std::size_t size) {
-  return problem(file, ": expected at most " + std::to_string(kLargestPreferenceFile) +
-                           " bytes, found " +
-                           (size == 0 ? std::string("more") : std::to_string(size)));
+// `size` may be less than the limit: the file grew after that was found.
+PreferenceFileError tooLarge(const std::filesystem::path& file, std::uint64_t size) {
+  return problem(file,
+                 ": expected at most " + std::to_string(kLargestPreferenceFile) + " bytes, found " +
+                     (size <= kLargestPreferenceFile ? std::string("more") : std::to_string(size)));
 }
 
 std::variant<std::optional<PreferenceText>, PreferenceFileError> readText(
     const std::filesystem::path& file) {
-  // O_NONBLOCK: opening a pipe without a writer would block.
-  const UniqueFd descriptor(::open(file.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
-  if (!descriptor) {
-    if (errno == ENOENT || errno == ENOTDIR) return std::nullopt;
-    return problem(file, errno);
+  FileContent content = readWholeFile({.path = file.c_str(), .most = kLargestPreferenceFile});
+  switch (content.outcome) {
+    case FileContent::Outcome::kRead:
+      return PreferenceText{std::move(content.bytes), content.mode & 07777U};
+    case FileContent::Outcome::kMissing:
+      return std::nullopt;
+    case FileContent::Outcome::kNotRegular:
+      return problem(file, ": expected a regular file");
+    case FileContent::Outcome::kTooLarge:
+      return tooLarge(file, content.size);
+    case FileContent::Outcome::kFailed:
+      break;
   }
-  struct stat status {};
-  if (::fstat(descriptor.get(), &status) != 0) return problem(file, errno);
-  if (!S_ISREG(status.st_mode)) return problem(file, ": expected a regular file");
-  if (static_cast<std::size_t>(status.st_size) > kLargestPreferenceFile) {
-    return tooLarge(file, static_cast<std::size_t>(status.st_size));
-  }
-  PreferenceText content{{}, status.st_mode & 07777U};
-  std::array<char, 16'384> buffer;
-  while (content.text.size() <= kLargestPreferenceFile) {
-    const ssize_t count = ::read(descriptor.get(), buffer.data(), buffer.size());
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return problem(file, errno);
-    if (count == 0) return content;
-    content.text.append(buffer.data(), static_cast<std::size_t>(count));
-  }
-  return tooLarge(file, 0);  // the file grew after fstat()
+  return problem(file, content.error);
 }
 
 }  // namespace

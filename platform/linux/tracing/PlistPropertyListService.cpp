@@ -4,17 +4,17 @@
 #include <cerrno>
 #include <cstdlib>
 #include <filesystem>
+#include <span>
 #include <system_error>
 #include <utility>
 #include <vector>
 
-#include <fcntl.h>
 #include <plist/plist.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/base/Utf8.h"
+#include "platform/linux/base/WholeFile.h"
 #include "platform/linux/files/FileError.h"
 #include "platform/linux/tracing/PropertyListShape.h"
 
@@ -31,20 +31,6 @@ Error parseError(std::string_view what) {
   return {.domain = "com.tarno.halvox.propertylist",
           .code = EINVAL,
           .description = "the property list " + std::string(what)};
-}
-
-// Reads until the buffer is full or the file ends. Returns 0 or the system's error.
-int readAll(int descriptor, std::vector<std::byte>& bytes) {
-  std::size_t filled = 0;
-  while (filled < bytes.size()) {
-    const ssize_t count = ::read(descriptor, bytes.data() + filled, bytes.size() - filled);
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return errno;
-    if (count == 0) break;
-    filled += static_cast<std::size_t>(count);
-  }
-  bytes.resize(filled);
-  return 0;
 }
 
 Value convert(plist_t node, std::size_t levelsLeft, bool& isTooDeep);
@@ -165,21 +151,20 @@ std::optional<Data> PlistPropertyListService::readFile(std::string_view path,
     return std::nullopt;
   };
   if (name.find('\0') != std::string::npos) return fail(EINVAL);
-  // O_NONBLOCK: opening a pipe would wait for its writer. O_NOCTTY: a terminal must not become
-  // ours.
-  const UniqueFd file(::open(name.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
-  if (!file) return fail(errno);
-  struct stat status {};
-  if (::fstat(file.get(), &status) != 0) return fail(errno);
-  if (S_ISDIR(status.st_mode)) return fail(EISDIR);
-  if (!S_ISREG(status.st_mode)) return fail(EINVAL);
-  // The buffer has one byte more than the file, which shows a file that grows while it is read.
-  const auto size = static_cast<std::uint64_t>(status.st_size);
-  if (size > kMostFileBytes) return fail(EFBIG);
-  std::vector<std::byte> bytes(static_cast<std::size_t>(size) + 1);
-  if (const int failed = readAll(file.get(), bytes)) return fail(failed);
-  if (bytes.size() > size) return fail(EAGAIN);
-  return Data(bytes);
+  const FileContent content = readWholeFile({.path = name.c_str(), .most = kMostFileBytes});
+  switch (content.outcome) {
+    case FileContent::Outcome::kRead:
+      if (content.bytes.size() > content.size) return fail(EAGAIN);  // the file is being written
+      return Data(std::as_bytes(std::span(content.bytes)));
+    case FileContent::Outcome::kNotRegular:
+      return fail(S_ISDIR(content.mode) ? EISDIR : EINVAL);
+    case FileContent::Outcome::kTooLarge:
+      return fail(content.size > kMostFileBytes ? EFBIG : EAGAIN);
+    case FileContent::Outcome::kMissing:
+    case FileContent::Outcome::kFailed:
+      break;
+  }
+  return fail(content.error);
 }
 
 std::optional<Value> PlistPropertyListService::parse(const std::optional<Data>& bytes,

@@ -8,7 +8,7 @@
 #include <dirent.h>
 #include <fcntl.h>
 
-#include "platform/linux/drivers/SmallFile.h"
+#include "platform/linux/base/WholeFile.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -41,9 +41,10 @@ std::vector<std::string> namesIn(int directory) {
 }
 
 std::optional<std::string> textOf(int directory, const std::string& name) {
-  SmallFile file = readSmallFile(directory, name.c_str(), kLargestFile);
-  if (file.outcome != SmallFile::Outcome::kRead) return std::nullopt;
-  return std::move(file.text);
+  FileContent file =
+      readWholeFile({.path = name.c_str(), .most = kLargestFile, .directory = directory});
+  if (!file.isRead()) return std::nullopt;
+  return std::move(file.bytes);
 }
 
 std::optional<std::uint64_t> numberIn(int directory, const char* name) {
@@ -95,7 +96,7 @@ std::string AlsaSource::nameFor(const std::string& folder, const std::string& na
 }
 
 void AlsaSource::readCard(int asound, const std::string& folder, Card card) {
-  const UniqueFd directory = openDirectoryAt(asound, folder.c_str());
+  const UniqueFd directory = openDirectory(folder.c_str(), asound);
   if (!directory) return;
   for (const std::string& pcm : namesIn(directory.get())) {
     if (!pcm.starts_with("pcm")) continue;
@@ -110,7 +111,7 @@ void AlsaSource::readPcm(int cardDirectory, const std::string& path, const std::
                          Card& card) {
   const bool isPlayback = folder.ends_with('p');
   if (!isPlayback && !folder.ends_with('c')) return;
-  const UniqueFd directory = openDirectoryAt(cardDirectory, folder.c_str());
+  const UniqueFd directory = openDirectory(folder.c_str(), cardDirectory);
   if (!directory) return;
   std::string name = parsePcmName(textOf(directory.get(), "info").value_or("")).value_or(folder);
   // If several devices have the same name, the later ones get a number.

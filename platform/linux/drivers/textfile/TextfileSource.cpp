@@ -11,8 +11,8 @@
 #include <fcntl.h>
 
 #include "platform/linux/base/ErrnoText.h"
+#include "platform/linux/base/WholeFile.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
-#include "platform/linux/drivers/SmallFile.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -36,15 +36,15 @@ std::int64_t now() {
       .count();
 }
 
-std::string reasonOf(const SmallFile& file) {
+std::string reasonOf(const FileContent& file) {
   switch (file.outcome) {
-    case SmallFile::Outcome::kTooLarge:
+    case FileContent::Outcome::kTooLarge:
       return "the file is larger than " + std::to_string(OpenMetricsText::kLargestText) + " bytes";
-    case SmallFile::Outcome::kNotRegular:
+    case FileContent::Outcome::kNotRegular:
       return "expected a regular file";
-    case SmallFile::Outcome::kRead:
-    case SmallFile::Outcome::kMissing:
-    case SmallFile::Outcome::kFailed:
+    case FileContent::Outcome::kRead:
+    case FileContent::Outcome::kMissing:
+    case FileContent::Outcome::kFailed:
       break;
   }
   return errnoText(file.error);
@@ -136,19 +136,20 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
                     entry);
   }
 
-  const SmallFile content = readSmallFile(directory, file.c_str(), OpenMetricsText::kLargestText);
-  const std::size_t hash = std::hash<std::string>()(content.text);
-  const bool isRead = content.outcome == SmallFile::Outcome::kRead;
+  const FileContent content = readWholeFile(
+      {.path = file.c_str(), .most = OpenMetricsText::kLargestText, .directory = directory});
+  const std::size_t hash = std::hash<std::string>()(content.bytes);
+  const bool isRead = content.isRead();
   // Most files that are read again have not changed again. Comparing a hash saves parsing them.
   if (isSame && isRead && entry.hash == hash) return;
   entry.hash = isRead ? std::optional(hash) : std::nullopt;
   entry.isGood = false;
   isChanged_ = true;
-  if (content.outcome == SmallFile::Outcome::kMissing) return;  // deleted since it was listed
+  if (content.isMissing()) return;  // deleted since it was listed
   if (!isRead) {
     return complain(file, ": " + reasonOf(content) + kSkipped, entry);
   }
-  auto parsed = MetricChannels::from(content.text);
+  auto parsed = MetricChannels::from(content.bytes);
   if (const auto* error = std::get_if<MetricError>(&parsed)) {
     return complain(file, ":" + std::to_string(error->line) + ": " + error->what + kSkipped, entry);
   }

@@ -2,12 +2,13 @@
 
 #include <csignal>
 #include <fstream>
-#include <iterator>
 #include <thread>
 
 #include <fcntl.h>
 #include <spawn.h>
 #include <unistd.h>
+
+#include "platform/linux/base/WholeFile.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -16,8 +17,8 @@ namespace {
 constexpr std::chrono::milliseconds kLookEvery{10};
 
 std::string startTimeOf(pid_t pid) {
-  std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
-  std::string text((std::istreambuf_iterator<char>(file)), {});
+  const std::string path = "/proc/" + std::to_string(pid) + "/stat";
+  const std::string text = readWholeFile({.path = path.c_str(), .most = 4096}).bytes;
   // The process name may contain anything, and ends at the last ")". The start time is field 22.
   const std::size_t name = text.rfind(')');
   if (name == std::string::npos) return {};

@@ -1,0 +1,103 @@
+#include "platform/linux/base/WholeFile.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <utility>
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+using Outcome = FileContent::Outcome;
+
+constexpr std::size_t kPieceSize = 16'384;
+
+void fail(FileContent& content, int error) {
+  const bool isMissing = error == ENOENT || error == ENOTDIR;
+  content.outcome = isMissing ? Outcome::kMissing : Outcome::kFailed;
+  content.error = error;
+}
+
+// Keeps what is known of the file. Returns false if it is not one to read.
+bool accept(const FileToRead& file, const struct stat& status, FileContent& content) {
+  content.size = static_cast<std::uint64_t>(status.st_size);
+  content.mode = status.st_mode;
+  if (file.kinds == FileToRead::Kinds::kAny) return true;
+  if (!S_ISREG(status.st_mode)) {
+    content.outcome = Outcome::kNotRegular;
+    return false;
+  }
+  const bool isRefused = file.excess == FileToRead::Excess::kRefused && content.size > file.most;
+  if (isRefused) content.outcome = Outcome::kTooLarge;
+  return !isRefused;
+}
+
+// Looks at the file before it is opened. Returns false if it is not to be opened.
+bool isToBeOpened(const FileToRead& file, FileContent& content) {
+  if (file.kinds == FileToRead::Kinds::kAny) return true;
+  const bool refusesLinks = file.links == FileToRead::Links::kRefused;
+  struct stat status {};
+  if (::fstatat(file.directory, file.path, &status, refusesLinks ? AT_SYMLINK_NOFOLLOW : 0) != 0) {
+    fail(content, errno);
+    return false;
+  }
+  if (S_ISLNK(status.st_mode)) {
+    fail(content, ELOOP);  // what open() says with O_NOFOLLOW
+    return false;
+  }
+  return accept(file, status, content);
+}
+
+void readAll(int descriptor, const FileToRead& file, FileContent& content) {
+  content.bytes.reserve(std::min<std::uint64_t>(content.size, file.most));
+  std::array<char, kPieceSize> piece;
+  while (true) {
+    // One byte more than wanted shows whether the file is longer.
+    const std::size_t room = std::min(piece.size(), file.most - content.bytes.size() + 1);
+    const ssize_t count = ::read(descriptor, piece.data(), room);
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return fail(content, errno);
+    if (count == 0) break;
+    content.bytes.append(piece.data(), static_cast<std::size_t>(count));
+    if (content.bytes.size() > file.most) {
+      content.bytes.resize(file.excess == FileToRead::Excess::kCut ? file.most : 0);
+      content.outcome = Outcome::kTooLarge;
+      return;
+    }
+  }
+  content.outcome = Outcome::kRead;
+}
+
+}  // namespace
+
+FileContent readWholeFile(const FileToRead& file) {
+  FileContent content;
+  if (!isToBeOpened(file, content)) return content;
+  // O_NONBLOCK: opening a pipe that has no writer would block, and the file may have become one.
+  const int links = file.links == FileToRead::Links::kRefused ? O_NOFOLLOW : 0;
+  const UniqueFd descriptor(
+      ::openat(file.directory, file.path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | links));
+  if (!descriptor) {
+    fail(content, errno);
+    return content;
+  }
+  // What is there now may be something else than what was looked at.
+  struct stat status {};
+  if (::fstat(descriptor.get(), &status) != 0) {
+    fail(content, errno);
+    return content;
+  }
+  if (!accept(file, status, content)) return content;
+  if (file.kinds == FileToRead::Kinds::kAny) ::fcntl(descriptor.get(), F_SETFL, 0);
+  readAll(descriptor.get(), file, content);
+  return content;
+}
+
+UniqueFd openDirectory(const char* path, int below) {
+  return UniqueFd(::openat(below, path, O_RDONLY | O_CLOEXEC | O_DIRECTORY));
+}
+
+}  // namespace halvox::platform::linux_

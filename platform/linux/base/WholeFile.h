@@ -1,0 +1,64 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+
+#include <fcntl.h>
+#include <sys/types.h>
+
+#include "platform/linux/base/UniqueHandle.h"
+
+namespace halvox::platform::linux_ {
+
+// Which file to read, and how.
+struct FileToRead {
+  // Regular files only, unless another program may hand the text over by a pipe: opening a device
+  // may do something, and reading a pipe waits for whoever writes to it.
+  enum class Kinds : std::uint8_t { kRegular, kAny };
+  // Whether a symbolic link in the last component of the path is followed.
+  enum class Links : std::uint8_t { kFollowed, kRefused };
+  // What happens if the file has more than `most` bytes.
+  enum class Excess : std::uint8_t { kRefused, kCut };
+
+  const char* path;          // the caller owns the text
+  std::size_t most;          // bytes
+  int directory = AT_FDCWD;  // where a relative path starts
+  Kinds kinds = Kinds::kRegular;
+  Links links = Links::kFollowed;
+  Excess excess = Excess::kRefused;
+};
+
+// What was read, or why nothing was.
+struct FileContent {
+  enum class Outcome : std::uint8_t {
+    kRead,        // `bytes` is the whole file
+    kMissing,     // there is no such file, or no directory on the way to it
+    kNotRegular,  // a directory, pipe, socket or device; `mode` says which
+    kTooLarge,    // more than `most` bytes; `bytes` has the first of them if they were to be cut
+    kFailed,      // `bytes` has what was read before the error
+  };
+
+  Outcome outcome = Outcome::kFailed;
+  int error = 0;  // errno of kMissing and kFailed
+  std::string bytes{};
+  // As the file system says when the file is opened; 0 before.
+  std::uint64_t size = 0;  // 0 for the files of /proc
+  mode_t mode = 0;         // type and permissions
+
+  [[nodiscard]] bool isRead() const { return outcome == Outcome::kRead; }
+  [[nodiscard]] bool isMissing() const { return outcome == Outcome::kMissing; }
+};
+
+// Reads a small file in one piece. Blocks on the disk. With Kinds::kRegular it never waits for
+// another process; with Kinds::kAny it waits for the end of what a pipe's writer writes, but
+// opening a pipe that has no writer does not block and reads an empty text. Does not rely on the
+// file's size, so it reads the files of /proc as well as a file that grows meanwhile. Any thread
+// may call it.
+[[nodiscard]] FileContent readWholeFile(const FileToRead& file);
+
+// Returns a directory to read files below, or an empty handle, with errno set, if it cannot be
+// opened. A relative path starts at `below`.
+[[nodiscard]] UniqueFd openDirectory(const char* path, int below = AT_FDCWD);
+
+}  // namespace halvox::platform::linux_
