@@ -1,11 +1,9 @@
-#include <array>
 #include <string>
 
 #include <gtest/gtest.h>
-#include <spawn.h>
-#include <sys/wait.h>
 
 #include "client/testing/TestService.h"
+#include "platform/linux/base/ChildProcess.h"
 
 namespace halvox::client {
 namespace {
@@ -15,16 +13,10 @@ using platform::Data;
 using platform::Date;
 
 // Runs the program that is written in C against this service; its exit status.
-int runCProgram(std::string socketPath) {
-  std::string program = HALVOX_C_TEST_PROGRAM;
-  const std::array<char*, 3> arguments{program.data(), socketPath.data(), nullptr};
-  pid_t pid = 0;
-  if (posix_spawn(&pid, program.c_str(), nullptr, nullptr, arguments.data(), environ) != 0) {
-    return -1;
-  }
-  int status = 0;
-  waitpid(pid, &status, 0);
-  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+int runCProgram(const std::string& socketPath) {
+  auto child =
+      platform::linux_::ChildProcess::start({.command = {HALVOX_C_TEST_PROGRAM, socketPath}});
+  return child ? child->wait().status : -1;
 }
 
 Value bytes(std::string_view text) { return Data(std::as_bytes(std::span(text))); }

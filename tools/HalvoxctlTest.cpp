@@ -7,12 +7,11 @@
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include "client/testing/TestService.h"
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/base/ChildProcess.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/diagnostics/SnapshotArchive.h"
 #include "platform/linux/store/SqliteStore.h"
@@ -21,6 +20,9 @@
 namespace halvox::tools {
 namespace {
 
+using platform::linux_::ChildEnd;
+using platform::linux_::ChildProcess;
+using platform::linux_::makePipe;
 using platform::linux_::UniqueFd;
 
 struct Outcome {
@@ -32,40 +34,28 @@ struct Outcome {
 Outcome runProgram(std::vector<std::string> arguments, const std::string& input = "",
                    const char* output = nullptr) {
   arguments.insert(arguments.begin(), HALVOXCTL);
-  std::vector<char*> pointers;
-  pointers.reserve(arguments.size() + 1);
-  for (auto& argument : arguments) pointers.push_back(argument.data());
-  pointers.push_back(nullptr);
-  int in[2];
-  int out[2];
-  if (pipe2(in, O_CLOEXEC) != 0 || pipe2(out, O_CLOEXEC) != 0) return {};
-  UniqueFd inRead(in[0]), inWrite(in[1]), outRead(out[0]), outWrite(out[1]);
+  auto in = makePipe();
+  auto out = makePipe();
+  if (!in || !out) return {};
+  const UniqueFd file(output == nullptr ? -1 : open(output, O_WRONLY | O_CLOEXEC));
+  auto child = ChildProcess::start(
+      {.command = arguments,
+       .descriptors = {
+           {.number = STDIN_FILENO, .ours = in->reader.get()},
+           {.number = STDOUT_FILENO, .ours = output == nullptr ? out->writer.get() : file.get()},
+           {.number = STDERR_FILENO}}});
+  if (!child) return {};
 
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_adddup2(&actions, inRead.get(), STDIN_FILENO);
-  if (output == nullptr) {
-    posix_spawn_file_actions_adddup2(&actions, outWrite.get(), STDOUT_FILENO);
-  } else {
-    posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, output, O_WRONLY, 0);
-  }
-  posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
-  pid_t pid = 0;
-  const int spawned = posix_spawn(&pid, HALVOXCTL, &actions, nullptr, pointers.data(), environ);
-  posix_spawn_file_actions_destroy(&actions);
-  if (spawned != 0) return {};
-
-  outWrite.reset();
-  static_cast<void>(!write(inWrite.get(), input.data(), input.size()));
-  inWrite.reset();
+  out->writer.reset();
+  static_cast<void>(!write(in->writer.get(), input.data(), input.size()));
+  in->writer.reset();
   Outcome outcome;
   std::array<char, 4096> buffer{};
-  for (ssize_t size = 0; (size = read(outRead.get(), buffer.data(), buffer.size())) > 0;) {
+  for (ssize_t size = 0; (size = read(out->reader.get(), buffer.data(), buffer.size())) > 0;) {
     outcome.out.append(buffer.data(), static_cast<std::size_t>(size));
   }
-  int status = 0;
-  waitpid(pid, &status, 0);
-  outcome.status = WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+  const ChildEnd end = child->wait();
+  outcome.status = end.signal == 0 ? end.status : -end.signal;
   return outcome;
 }
 

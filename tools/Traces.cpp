@@ -16,13 +16,12 @@
 #include <utility>
 #include <variant>
 
-#include <spawn.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include "client/HalvoxClient.h"
 #include "client/Vocabulary.h"
+#include "platform/linux/base/ChildProcess.h"
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/tracing/PlistPropertyListService.h"
 #include "tools/JsonText.h"
@@ -240,21 +239,15 @@ ExitStatus showMeasured(const std::string& file, const std::string& params, Outp
 }
 
 // What is wrong with how the program ran; empty when nothing is.
-std::string runProgram(std::vector<std::string> command) {
-  std::vector<char*> arguments;
-  arguments.reserve(command.size() + 1);
-  for (std::string& word : command) arguments.push_back(word.data());
-  arguments.push_back(nullptr);
-  pid_t pid = 0;
-  const int error = ::posix_spawnp(&pid, arguments[0], nullptr, nullptr, arguments.data(), environ);
-  if (error != 0) return "cannot run " + command[0] + ": " + platform::linux_::errnoText(error);
-  int status = 0;
-  while (::waitpid(pid, &status, 0) < 0 && errno == EINTR) {
-  }
-  if (WIFSIGNALED(status))
-    return command[0] + " was ended by signal " + std::to_string(WTERMSIG(status));
-  if (WEXITSTATUS(status) == 0) return {};
-  return command[0] + " ended with status " + std::to_string(WEXITSTATUS(status));
+std::string runProgram(const std::vector<std::string>& command) {
+  using namespace platform::linux_;
+  // The program is our caller's: it gets its signals, such as those that nohup ignores.
+  auto child =
+      ChildProcess::start({.command = command, .signals = ChildProgram::Signals::kInherited});
+  if (!child) return "cannot run " + command[0] + ": " + errnoText(child.error().code);
+  const ChildEnd end = child->wait();
+  if (end.isSuccess()) return {};
+  return command[0] + (end.signal != 0 ? " was " : " ") + end.text();
 }
 
 }  // namespace

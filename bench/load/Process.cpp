@@ -9,15 +9,9 @@
 #include <thread>
 
 #include <fcntl.h>
-#include <spawn.h>
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <sys/wait.h>
 #include <unistd.h>
-
-#include "platform/linux/base/ErrnoText.h"
-
-extern char** environ;
 
 namespace halvox::bench {
 namespace {
@@ -25,11 +19,12 @@ namespace {
 using std::chrono::milliseconds;
 using std::chrono::nanoseconds;
 
-std::vector<char*> pointers(std::vector<std::string>& texts) {
-  std::vector<char*> result;
-  for (std::string& text : texts) result.push_back(text.data());
-  result.push_back(nullptr);
-  return result;
+platform::linux_::ChildProcess start(const std::vector<std::string>& command,
+                                     const std::vector<std::string>& environment) {
+  auto child = platform::linux_::ChildProcess::start(
+      {.command = command, .environment = platform::linux_::environmentWith(environment)});
+  if (!child) throw std::runtime_error(child.error().message);
+  return *std::move(child);
 }
 
 bool isServed(const std::string& path) {
@@ -55,28 +50,17 @@ long statusNumber(const std::string& path, const std::string& name) {
 
 Process::Process(const std::vector<std::string>& command,
                  const std::vector<std::string>& environment)
-    : pid_(-1) {
-  std::vector<std::string> arguments = command;
-  std::vector<std::string> settings = environment;
-  std::vector<char*> variables = pointers(settings);
-  variables.pop_back();
-  for (char** variable = environ; *variable != nullptr; ++variable) variables.push_back(*variable);
-  variables.push_back(nullptr);
-  const int error = ::posix_spawnp(&pid_, arguments.front().c_str(), nullptr, nullptr,
-                                   pointers(arguments).data(), variables.data());
-  if (error != 0)
-    throw std::runtime_error(command.front() + ": " + platform::linux_::errnoText(error));
-}
+    : child_(start(command, environment)) {}
 
 Process::~Process() {
-  ::kill(pid_, SIGTERM);
-  ::waitpid(pid_, nullptr, 0);
+  child_.signal(SIGTERM);
+  child_.wait();
 }
 
-void Process::waitForSocket(const std::string& path) const {
+void Process::waitForSocket(const std::string& path) {
   for (int attempt = 0; attempt < 1000; ++attempt) {
     if (isServed(path)) return;
-    if (::waitpid(pid_, nullptr, WNOHANG) == pid_) break;
+    if (child_.poll()) break;
     std::this_thread::sleep_for(milliseconds(10));
   }
   throw std::runtime_error("the server does not accept connections on " + path);
@@ -85,7 +69,8 @@ void Process::waitForSocket(const std::string& path) const {
 nanoseconds Process::cpuTime() const {
   clockid_t clock{};
   timespec time{};
-  if (::clock_getcpuclockid(pid_, &clock) != 0 || ::clock_gettime(clock, &time) != 0) return {};
+  if (::clock_getcpuclockid(child_.pid(), &clock) != 0 || ::clock_gettime(clock, &time) != 0)
+    return {};
   return std::chrono::seconds(time.tv_sec) + nanoseconds(time.tv_nsec);
 }
 
@@ -111,20 +96,20 @@ void Process::waitForRest() const {
 }
 
 long Process::residentKib() const {
-  return statusNumber("/proc/" + std::to_string(pid_) + "/status", "VmRSS");
+  return statusNumber("/proc/" + std::to_string(child_.pid()) + "/status", "VmRSS");
 }
 
 long Process::peakKib() const {
-  return statusNumber("/proc/" + std::to_string(pid_) + "/status", "VmHWM");
+  return statusNumber("/proc/" + std::to_string(child_.pid()) + "/status", "VmHWM");
 }
 
 void Process::forgetPeak() const {
-  std::ofstream("/proc/" + std::to_string(pid_) + "/clear_refs") << "5";
+  std::ofstream("/proc/" + std::to_string(child_.pid()) + "/clear_refs") << "5";
 }
 
 long Process::sleeps() const {
   long count = 0;
-  const std::string tasks = "/proc/" + std::to_string(pid_) + "/task";
+  const std::string tasks = "/proc/" + std::to_string(child_.pid()) + "/task";
   for (const auto& task : std::filesystem::directory_iterator(tasks)) {
     count += statusNumber(task.path().string() + "/status", "voluntary_ctxt_switches");
   }

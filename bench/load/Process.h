@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include <sys/types.h>
+#include "platform/linux/base/ChildProcess.h"
 
 namespace halvox::bench {
 
@@ -20,7 +20,7 @@ class Process {
 
   // Waits until the socket accepts connections. Throws when the process ends before, or after ten
   // seconds.
-  void waitForSocket(const std::string& path) const;
+  void waitForSocket(const std::string& path);
   // The CPU time of all threads so far.
   [[nodiscard]] std::chrono::nanoseconds cpuTime() const;
   // Waits until the process uses no CPU for 100 ms and returns its CPU time. This includes work
@@ -36,7 +36,7 @@ class Process {
   [[nodiscard]] long sleeps() const;
 
  private:
-  pid_t pid_;
+  platform::linux_::ChildProcess child_;
 };
 
 // A temporary directory. The destructor deletes it with its content.

@@ -16,7 +16,7 @@
 namespace halvox::pipewire_reporter {
 namespace {
 
-using pipewire_testing::ChildProcess;
+using pipewire_testing::PipedProcess;
 using pipewire_testing::PrivatePipeWire;
 using std::chrono::steady_clock;
 
@@ -60,8 +60,8 @@ class StreamWatcherTest : public testing::Test {
     return platform::linux_::eventually(condition,
                                         [this] { pw_loop_iterate(loop->handle(), 100); });
   }
-  [[nodiscard]] ChildProcess play(double seconds, const std::string& role = "Music") const {
-    return ChildProcess(
+  [[nodiscard]] PipedProcess play(double seconds, const std::string& role = "Music") const {
+    return PipedProcess(
         {"pw-play", "--volume", "0.5", "--media-role", role, audio->makeTone(seconds)});
   }
 
@@ -74,7 +74,7 @@ class StreamWatcherTest : public testing::Test {
 };
 
 TEST_F(StreamWatcherTest, ReportsPlaybackFromItsStartToItsEnd) {
-  ChildProcess player = play(0.5);
+  PipedProcess player = play(0.5);
 
   ASSERT_TRUE(waitFor("destroy"));
 
@@ -94,10 +94,10 @@ TEST_F(StreamWatcherTest, ReportsPlaybackFromItsStartToItsEnd) {
 }
 
 TEST_F(StreamWatcherTest, ReportsAVolumeThatIsChangedWhilePlaying) {
-  const ChildProcess player = play(20);
+  const PipedProcess player = play(20);
   ASSERT_TRUE(waitFor("volume"));
 
-  ChildProcess control({"pw-cli", "s", "pw-play", "Props", "{ channelVolumes: [ 0.5 ] }"});
+  PipedProcess control({"pw-cli", "s", "pw-play", "Props", "{ channelVolumes: [ 0.5 ] }"});
   ASSERT_TRUE(waitFor("volume", 2));
   EXPECT_EQ(control.wait(), 0);
 
@@ -106,7 +106,7 @@ TEST_F(StreamWatcherTest, ReportsAVolumeThatIsChangedWhilePlaying) {
 }
 
 TEST_F(StreamWatcherTest, ReportsCapture) {
-  const ChildProcess recorder(
+  const PipedProcess recorder(
       {"pw-record", "-P", "{ stream.capture.sink=true }", audio->directory() / "out.wav"});
 
   ASSERT_TRUE(waitFor("route"));
@@ -116,7 +116,7 @@ TEST_F(StreamWatcherTest, ReportsCapture) {
 }
 
 TEST_F(StreamWatcherTest, ReportsTheSerialOfTheStreamInItsIdentifier) {
-  const ChildProcess player = play(20);
+  const PipedProcess player = play(20);
   ASSERT_TRUE(waitFor("configure"));
 
   const auto serial = client.last("configure").find("object_serial")->toUInt64();
@@ -127,7 +127,7 @@ TEST_F(StreamWatcherTest, ReportsTheSerialOfTheStreamInItsIdentifier) {
 
 TEST_F(StreamWatcherTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItReturns) {
   {
-    const ChildProcess player = play(20);
+    const PipedProcess player = play(20);
     ASSERT_TRUE(waitFor("playback-start"));
     ASSERT_TRUE(audio->restart());
     ASSERT_TRUE(waitFor("destroy"));
@@ -138,7 +138,7 @@ TEST_F(StreamWatcherTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItRet
                log, [](const auto& line) { return line.starts_with("following"); }) == 2;
   }));
 
-  const ChildProcess player = play(20, "phone");
+  const PipedProcess player = play(20, "phone");
 
   EXPECT_TRUE(waitFor("playback-start", 2));
 }
@@ -154,7 +154,7 @@ TEST_F(StreamWatcherTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
     }
     return sum;
   };
-  const ChildProcess player = play(20);
+  const PipedProcess player = play(20);
   ASSERT_TRUE(waitFor("volume"));
   // A busy machine misses cycles by itself. Wait for a second without a report.
   double before = -1;
@@ -181,7 +181,7 @@ TEST_F(StreamWatcherTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
 
 TEST_F(StreamWatcherTest, SleepsWhileThereIsNoStreamThoughThereIsAProfiler) {
   {
-    const ChildProcess player = play(20);
+    const PipedProcess player = play(20);
     ASSERT_TRUE(waitFor("volume"));
   }
   ASSERT_TRUE(waitFor("destroy"));
@@ -195,7 +195,7 @@ TEST_F(StreamWatcherTest, SleepsWhileThereIsNoStreamThoughThereIsAProfiler) {
 TEST_F(StreamWatcherTest, SleepsWhileNothingChangesWithoutXruns) {
   follow({.remote = {}, .log = {}, .xruns = false});
 
-  const ChildProcess player = play(20);
+  const PipedProcess player = play(20);
   ASSERT_TRUE(waitFor("volume"));
   // Let the last events of the start arrive.
   while (pw_loop_iterate(loop->handle(), 500) > 0) {

@@ -13,9 +13,9 @@
 #include "platform/linux/connection/ConnectionLimits.h"
 #include "platform/linux/connection/testing/AnotherUser.h"
 #include "platform/linux/connection/testing/BusClient.h"
-#include "platform/linux/connection/testing/ChildProcess.h"
 #include "platform/linux/connection/testing/RawClient.h"
 #include "platform/linux/connection/testing/ServiceUnderTest.h"
+#include "platform/linux/connection/testing/TestProcess.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -66,7 +66,7 @@ class PrivateBus {
 
  private:
   ScratchDirectory directory_;
-  std::optional<ChildProcess> daemon_;
+  std::optional<TestProcess> daemon_;
   std::string address_;
 };
 

@@ -15,9 +15,9 @@
 
 #include "platform/linux/connection/SocketFile.h"
 #include "platform/linux/connection/testing/BusClient.h"
-#include "platform/linux/connection/testing/ChildProcess.h"
 #include "platform/linux/connection/testing/RawClient.h"
 #include "platform/linux/connection/testing/ServiceUnderTest.h"
+#include "platform/linux/connection/testing/TestProcess.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -47,7 +47,7 @@ int statusFor(ConnectionOpenError::Kind kind) { return 10 + static_cast<int>(kin
 
 TEST_F(ProcessTest, EndSignalsEndItInOrder) {
   for (const int number : {SIGTERM, SIGINT}) {
-    ChildProcess service(command());
+    TestProcess service(command());
     waitForSocket();
 
     service.signal(number);
@@ -58,10 +58,10 @@ TEST_F(ProcessTest, EndSignalsEndItInOrder) {
 }
 
 TEST_F(ProcessTest, SecondServiceIsTurnedAwayAndTheFirstGoesOn) {
-  ChildProcess first(command());
+  TestProcess first(command());
   waitForSocket();
 
-  ChildProcess second(command());
+  TestProcess second(command());
 
   EXPECT_EQ(second.waitForExit(), statusFor(ConnectionOpenError::Kind::kAlreadyServed));
   waitForSocket();
@@ -69,12 +69,12 @@ TEST_F(ProcessTest, SecondServiceIsTurnedAwayAndTheFirstGoesOn) {
 
 TEST_F(ProcessTest, SocketOfAKilledServiceIsReplaced) {
   {
-    ChildProcess killed(command());
+    TestProcess killed(command());
     waitForSocket();
   }
   ASSERT_TRUE(std::filesystem::is_socket(socketPath()));
 
-  ChildProcess service(command());
+  TestProcess service(command());
 
   waitForSocket();
 }
@@ -94,7 +94,7 @@ TEST_F(ProcessTest, PassedSocketTakesThePlaceOfItsOwn) {
   const std::vector<std::string> other = {HALVOX_TEST_SERVER,
                                           (directory_.path() / "unused").string()};
 
-  ChildProcess service(activated(other), {.passedFd = socket.fd.get()});
+  TestProcess service(activated(other), {.passedFd = socket.fd.get()});
 
   EXPECT_EQ(early.receive()->values[0].string(), "early");
   waitForSocket();
@@ -107,7 +107,7 @@ TEST_F(ProcessTest, PassedSocketTakesThePlaceOfItsOwn) {
 TEST_F(ProcessTest, PassedDescriptorThatDoesNotListenIsRefused) {
   const UniqueFd socket(::socket(AF_UNIX, SOCK_STREAM, 0));
 
-  ChildProcess service(activated(command()), {.passedFd = socket.get()});
+  TestProcess service(activated(command()), {.passedFd = socket.get()});
 
   EXPECT_EQ(service.waitForExit(), statusFor(ConnectionOpenError::Kind::kBadActivation));
 }
@@ -122,7 +122,7 @@ TEST_F(ProcessTest, ManagerIsToldWhenItServes) {
   timeval timeout{.tv_sec = kTestDeadline.count(), .tv_usec = 0};
   setsockopt(notify.get(), SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout);
 
-  const ChildProcess service(command(), {.environment = {"NOTIFY_SOCKET=" + notifyPath.string()}});
+  const TestProcess service(command(), {.environment = {"NOTIFY_SOCKET=" + notifyPath.string()}});
 
   std::array<char, 256> text{};
   ASSERT_GT(recv(notify.get(), text.data(), text.size() - 1, 0), 0);
@@ -136,7 +136,7 @@ TEST_F(ProcessTest, ClientsWaitWithoutCostWhenDescriptorsRunOut) {
 #endif
   std::vector<std::string> limited = command();
   limited.emplace_back("32");
-  ChildProcess service(limited);
+  TestProcess service(limited);
   waitForSocket();
   std::vector<std::unique_ptr<RawClient>> clients;
   for (int client = 0; client < 60; ++client) {
@@ -159,7 +159,7 @@ TEST_F(ProcessTest, ClientsWaitWithoutCostWhenDescriptorsRunOut) {
 }
 
 TEST_F(ProcessTest, IdleServiceMakesNoWakeUps) {
-  ChildProcess service(command());
+  TestProcess service(command());
   waitForSocket();
   std::vector<std::unique_ptr<BusClient>> clients;
   for (int client = 0; client < 20; ++client) {

@@ -19,7 +19,7 @@ namespace halvox::platform::linux_ {
 namespace {
 
 using namespace std::chrono_literals;
-using pipewire_testing::ChildProcess;
+using pipewire_testing::PipedProcess;
 using pipewire_testing::PrivatePipeWire;
 using ::testing::ElementsAre;
 using Clock = std::chrono::steady_clock;
@@ -104,8 +104,8 @@ class PipeWireDriverSourceTest : public ::testing::Test {
   }
   void TearDown() override { source.reset(); }
 
-  [[nodiscard]] ChildProcess play(double seconds) const {
-    return ChildProcess({"pw-play", "--volume", "0.5", audio->makeTone(seconds)});
+  [[nodiscard]] PipedProcess play(double seconds) const {
+    return PipedProcess({"pw-play", "--volume", "0.5", audio->makeTone(seconds)});
   }
 
   FakePlatform platform;
@@ -127,7 +127,7 @@ TEST_F(PipeWireDriverSourceTest, TheFirstReadingHasTheNodesAndTheirStates) {
 TEST_F(PipeWireDriverSourceTest, CyclesOfAPlaybackAreCountedWhileAReadingIsHeld) {
   const auto first = source->read();
   ASSERT_TRUE(eventually([&] { return source->isProfiling(); }));
-  ChildProcess player = play(2);
+  PipedProcess player = play(2);
 
   ASSERT_EQ(player.wait(), 0);
   // Two seconds of cycles of at most 2,048 frames.
@@ -152,7 +152,7 @@ TEST_F(PipeWireDriverSourceTest, TheProfilerIsBoundOnlyWhileReadingsAreHeld) {
   ASSERT_TRUE(eventually([&] { return source->isProfiling(); }));
 
   first.reset();
-  const ChildProcess player = play(20);
+  const PipedProcess player = play(20);
   ASSERT_TRUE(eventually([&] { return valueOf(source->read(), kCycles) > 0; }));
   EXPECT_TRUE(source->isProfiling());
   second.reset();
@@ -165,7 +165,7 @@ TEST_F(PipeWireDriverSourceTest, ASourceHasItsChannelsInItsGroupAndLosesThemWhen
   ASSERT_EQ(valueOf(source->read(), kSource), -1);
 
   {
-    ChildProcess creator({"pw-cli"});
+    PipedProcess creator({"pw-cli"});
     creator.writeLine(
         "create-node adapter { factory.name=support.null-audio-sink node.name=demo-microphone "
         "media.class=Audio/Source/Virtual audio.position=[ MONO ] }");
@@ -194,7 +194,7 @@ TEST_F(PipeWireDriverSourceTest, AServerThatAppearsWhileAReadingIsHeldIsFound) {
 TEST_F(PipeWireDriverSourceTest, ARestartedServerIsFoundAgainAndItsNodesCountOn) {
   const auto held = source->read();
   {
-    ChildProcess player = play(0.5);
+    PipedProcess player = play(0.5);
     ASSERT_EQ(player.wait(), 0);
   }
   ASSERT_TRUE(eventually([&] { return valueOf(source->read(), kCycles) > 0; }));

@@ -1,17 +1,14 @@
 #include "platform/linux/pipewire/testing/PrivatePipeWire.h"
 
-#include <array>
 #include <cmath>
 #include <csignal>
 #include <cstdint>
 #include <cstdlib>
 #include <fstream>
 #include <numbers>
+#include <stdexcept>
 #include <system_error>
 
-#include <fcntl.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 namespace halvox::pipewire_testing {
@@ -45,78 +42,49 @@ std::string makeWave(const std::string& samples) {
 
 }  // namespace
 
-ChildProcess::ChildProcess(const std::vector<std::string>& command) {
-  std::array<int, 2> input{};
-  std::array<int, 2> output{};
-  if (pipe2(input.data(), O_CLOEXEC) != 0 || pipe2(output.data(), O_CLOEXEC) != 0) {
-    throw std::system_error(errno, std::generic_category(), "pipe");
-  }
-  posix_spawn_file_actions_t actions{};
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_adddup2(&actions, input[0], STDIN_FILENO);
-  posix_spawn_file_actions_adddup2(&actions, output[1], STDOUT_FILENO);
-  // Unblock all signals: the event loop blocks SIGTERM and SIGINT, and children inherit that.
-  sigset_t noSignals;
-  sigemptyset(&noSignals);
-  posix_spawnattr_t attributes{};
-  posix_spawnattr_init(&attributes);
-  posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK);
-  posix_spawnattr_setsigmask(&attributes, &noSignals);
-  std::vector<char*> arguments;
-  arguments.reserve(command.size() + 1);
-  for (const auto& argument : command) {
-    arguments.push_back(const_cast<char*>(argument.c_str()));
-  }
-  arguments.push_back(nullptr);
-  const int error =
-      posix_spawnp(&pid_, arguments[0], &actions, &attributes, arguments.data(), environ);
-  posix_spawnattr_destroy(&attributes);
-  posix_spawn_file_actions_destroy(&actions);
-  close(input[0]);
-  close(output[1]);
-  input_ = input[1];
-  output_ = output[0];
-  if (error != 0) {
-    pid_ = -1;
-  }
+PipedProcess::PipedProcess(const std::vector<std::string>& command) {
+  auto input = platform::linux_::makePipe();
+  if (!input) throw std::runtime_error(input.error().message);
+  auto output = platform::linux_::makePipe();
+  if (!output) throw std::runtime_error(output.error().message);
+  // The event loop of a test blocks SIGTERM and SIGINT, and the child must not inherit that.
+  auto child = platform::linux_::ChildProcess::start(
+      {.command = command,
+       .descriptors = {{.number = STDIN_FILENO, .ours = input->reader.get()},
+                       {.number = STDOUT_FILENO, .ours = output->writer.get()}}});
+  if (child) child_ = *std::move(child);
+  input_ = std::move(input->writer);
+  output_ = std::move(output->reader);
 }
 
-ChildProcess::~ChildProcess() {
-  if (pid_ > 0) {
-    kill(pid_, SIGTERM);
-  }
-  close(input_);
+PipedProcess::~PipedProcess() {
+  signal(SIGTERM);
+  input_.reset();
   wait();
-  close(output_);
 }
 
-void ChildProcess::writeLine(const std::string& line) const {
+void PipedProcess::writeLine(const std::string& line) const {
   const std::string text = line + '\n';
-  [[maybe_unused]] const auto written = write(input_, text.data(), text.size());
+  [[maybe_unused]] const auto written = write(input_.get(), text.data(), text.size());
 }
 
-std::string ChildProcess::readLine() const {
+std::string PipedProcess::readLine() const {
   std::string line;
   char letter = 0;
-  while (read(output_, &letter, 1) == 1 && letter != '\n') {
+  while (read(output_.get(), &letter, 1) == 1 && letter != '\n') {
     line += letter;
   }
   return line;
 }
 
-void ChildProcess::signal(int number) const { kill(pid_, number); }
-
-int ChildProcess::wait() {
-  int status = -1;
-  if (pid_ > 0) {
-    waitpid(pid_, &status, 0);
-    pid_ = -1;
-  }
-  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+void PipedProcess::signal(int number) const {
+  if (child_) child_->signal(number);
 }
 
+int PipedProcess::wait() { return child_ ? child_->wait().status : -1; }
+
 std::string PrivatePipeWire::missingTools() {
-  return ChildProcess({HALVOX_PRIVATE_PIPEWIRE, "check"}).readLine();
+  return PipedProcess({HALVOX_PRIVATE_PIPEWIRE, "check"}).readLine();
 }
 
 PrivatePipeWire::PrivatePipeWire() {
@@ -125,7 +93,7 @@ PrivatePipeWire::PrivatePipeWire() {
     throw std::system_error(errno, std::generic_category(), "mkdtemp");
   }
   directory_ = name;
-  server_ = std::make_unique<ChildProcess>(
+  server_ = std::make_unique<PipedProcess>(
       std::vector<std::string>{HALVOX_PRIVATE_PIPEWIRE, "serve", directory_});
   ready_ = server_->readLine() == "ready";
   if (ready_) {

@@ -2,22 +2,23 @@
 
 #include <filesystem>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
-#include <sys/types.h>
+#include "platform/linux/base/ChildProcess.h"
 
 namespace halvox::pipewire_testing {
 
 // For tests: a child process with pipes to its standard input and output. The destructor closes the
 // input, sends SIGTERM and waits for the process. A program that cannot be started is one that has
 // ended.
-class ChildProcess {
+class PipedProcess {
  public:
-  explicit ChildProcess(const std::vector<std::string>& command);
-  ~ChildProcess();
-  ChildProcess(const ChildProcess&) = delete;
-  ChildProcess& operator=(const ChildProcess&) = delete;
+  explicit PipedProcess(const std::vector<std::string>& command);
+  ~PipedProcess();
+  PipedProcess(const PipedProcess&) = delete;
+  PipedProcess& operator=(const PipedProcess&) = delete;
 
   void writeLine(const std::string& line) const;
   // Waits for the next line of output; returns an empty text when the process has ended.
@@ -27,9 +28,9 @@ class ChildProcess {
   int wait();
 
  private:
-  pid_t pid_ = -1;
-  int input_ = -1;
-  int output_ = -1;
+  platform::linux_::UniqueFd input_;
+  platform::linux_::UniqueFd output_;
+  std::optional<platform::linux_::ChildProcess> child_;  // none if it did not start
 };
 
 // For tests: a private PipeWire server with WirePlumber and a null sink, without hardware, in a
@@ -55,7 +56,7 @@ class PrivatePipeWire {
   void enterEnvironment() const;
 
   std::filesystem::path directory_;
-  std::unique_ptr<ChildProcess> server_;
+  std::unique_ptr<PipedProcess> server_;
   bool ready_ = false;
 };
 

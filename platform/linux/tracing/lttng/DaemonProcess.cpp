@@ -4,10 +4,6 @@
 #include <fstream>
 #include <thread>
 
-#include <fcntl.h>
-#include <spawn.h>
-#include <unistd.h>
-
 #include "platform/linux/base/WholeFile.h"
 
 namespace halvox::platform::linux_ {
@@ -29,14 +25,6 @@ std::string startTimeOf(pid_t pid) {
   }
   if (at == std::string::npos || text.compare(name, 3, ") Z") == 0) return {};
   return text.substr(at + 1, text.find(' ', at + 1) - at - 1);
-}
-
-void addStream(posix_spawn_file_actions_t& actions, int ours, int theirs) {
-  if (ours >= 0) {
-    ::posix_spawn_file_actions_adddup2(&actions, ours, theirs);
-  } else {
-    ::posix_spawn_file_actions_addopen(&actions, theirs, "/dev/null", O_RDWR, 0);
-  }
 }
 
 }  // namespace
@@ -70,37 +58,6 @@ void DaemonProcess::end(std::chrono::milliseconds within) const {
     }
     if (!isAlive()) return;
   }
-}
-
-int startApart(const ProgramApart& program, pid_t& pid) {
-  posix_spawn_file_actions_t actions;
-  ::posix_spawn_file_actions_init(&actions);
-  addStream(actions, program.input, STDIN_FILENO);
-  addStream(actions, program.output, STDOUT_FILENO);
-  addStream(actions, -1, STDERR_FILENO);
-  posix_spawnattr_t attributes;
-  ::posix_spawnattr_init(&attributes);
-  // Our threads block all signals and the service ignores some. Other programs expect neither.
-  sigset_t signals;
-  ::sigemptyset(&signals);
-  if (program.endSignals == ProgramApart::EndSignals::kBlocked) {
-    for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGQUIT}) ::sigaddset(&signals, signal);
-  }
-  ::posix_spawnattr_setsigmask(&attributes, &signals);
-  ::sigfillset(&signals);
-  ::posix_spawnattr_setsigdefault(&attributes, &signals);
-  constexpr int kFlags = POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSID;
-  ::posix_spawnattr_setflags(&attributes, kFlags);
-  std::vector<std::string> words = program.command;
-  std::vector<char*> arguments;
-  arguments.reserve(words.size() + 1);
-  for (std::string& word : words) arguments.push_back(word.data());
-  arguments.push_back(nullptr);
-  const int error =
-      ::posix_spawnp(&pid, arguments[0], &actions, &attributes, arguments.data(), environ);
-  ::posix_spawnattr_destroy(&attributes);
-  ::posix_spawn_file_actions_destroy(&actions);
-  return error;
 }
 
 }  // namespace halvox::platform::linux_

@@ -4,7 +4,6 @@
 #include <filesystem>
 #include <optional>
 #include <string>
-#include <vector>
 
 #include <sys/types.h>
 
@@ -31,19 +30,5 @@ struct DaemonProcess {
   // has ended, at most for twice the time.
   void end(std::chrono::milliseconds within) const;
 };
-
-// How to start a program independent of ours: in a session of its own, because a Ctrl-C in the
-// service's terminal must not end the tracer before the traces are read; with default signal
-// handling, because our threads block signals; and with no descriptor of ours except these. -1
-// stands for /dev/null.
-struct ProgramApart {
-  std::vector<std::string> command;  // the program is searched for in PATH unless it has a slash
-  int input = -1;
-  int output = -1;
-  enum class EndSignals : bool { kHeeded, kBlocked } endSignals = EndSignals::kHeeded;
-};
-
-// Returns 0 and sets `pid`, or returns the system's error.
-[[nodiscard]] int startApart(const ProgramApart& program, pid_t& pid);
 
 }  // namespace halvox::platform::linux_

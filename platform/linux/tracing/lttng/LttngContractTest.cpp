@@ -19,7 +19,6 @@
 #include <grp.h>
 #include <gtest/gtest.h>
 #include <lttng/lttng.h>
-#include <spawn.h>
 #include <sys/prctl.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -28,6 +27,7 @@
 #include "platform/fake/FakePlatform.h"
 #include "platform/fake/contracts/KtraceContract.h"
 #include "platform/fake/contracts/PerformanceTraceContract.h"
+#include "platform/linux/base/ChildProcess.h"
 #include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
@@ -156,17 +156,11 @@ class LttngKtraceHarness : public LttngHarness {
                                        QueueThreading::kOwnThread);
   }
   void emit(const std::vector<std::uint32_t>& codes) {
-    std::vector<std::string> words{"emitter", "--emit"};
+    std::vector<std::string> words{"/proc/self/exe", "--emit"};
     for (const std::uint32_t code : codes) words.push_back(std::to_string(code));
-    std::vector<char*> arguments;
-    for (std::string& word : words) arguments.push_back(word.data());
-    arguments.push_back(nullptr);
-    pid_t process = 0;
-    ASSERT_EQ(
-        ::posix_spawn(&process, "/proc/self/exe", nullptr, nullptr, arguments.data(), environ), 0);
-    int status = 0;
-    ASSERT_EQ(::waitpid(process, &status, 0), process);
-    ASSERT_EQ(status, 0);
+    auto emitter = linux_::ChildProcess::start({.command = std::move(words)});
+    ASSERT_TRUE(emitter) << emitter.error().message;
+    ASSERT_TRUE(emitter->wait().isSuccess());
   }
 };
 

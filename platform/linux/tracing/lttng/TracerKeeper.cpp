@@ -1,8 +1,8 @@
 #include "platform/linux/tracing/lttng/TracerKeeper.h"
 
-#include <array>
 #include <cerrno>
 #include <charconv>
+#include <csignal>
 #include <string_view>
 #include <system_error>
 #include <thread>
@@ -11,10 +11,7 @@
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/file.h>
-#include <sys/wait.h>
 #include <unistd.h>
-
-#include "platform/linux/base/ErrnoText.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -32,17 +29,6 @@ std::string keeperPath() {
   const auto program = std::filesystem::read_symlink("/proc/self/exe", error);
   const auto beside = program.parent_path() / installed.filename();
   return !error && std::filesystem::exists(beside, error) ? beside : installed;
-}
-
-struct Pipe {
-  UniqueFd reading;
-  UniqueFd writing;
-};
-
-std::optional<Pipe> makePipe() {
-  std::array<int, 2> ends{};
-  if (::pipe2(ends.data(), O_CLOEXEC) != 0) return std::nullopt;
-  return Pipe{.reading = UniqueFd(ends[0]), .writing = UniqueFd(ends[1])};
 }
 
 // Reads one line, without its end. Empty if it does not come in time or the writer has gone. Byte
@@ -70,26 +56,30 @@ std::string readLine(int descriptor, milliseconds within) {
 
 std::optional<std::string> TracerKeeper::launch(const Ward& ward, DaemonProcess& daemon) {
   release();
-  const std::string program = keeperPath();
-  const std::string failed = "cannot start " + program + ": ";
+  const std::string path = keeperPath();
+  const std::string failed = "cannot start " + path + ": ";
   auto life = makePipe();
+  if (!life) return failed + life.error().message;
   auto answer = makePipe();
-  if (!life || !answer) return failed + errnoText(errno);
-  ProgramApart keeper{.command = {program, ward.noteFile.string(), ward.ownSessions},
-                      .input = life->reading.get(),
-                      .output = answer->writing.get(),
-                      .endSignals = ProgramApart::EndSignals::kBlocked};
+  if (!answer) return failed + answer.error().message;
+  // A session of its own: a Ctrl-C in the service's terminal must not end the keeper before the
+  // traces are read.
+  ChildProgram program{.command = {path, ward.noteFile.string(), ward.ownSessions},
+                       .descriptors = {{.number = STDIN_FILENO, .ours = life->reader.get()},
+                                       {.number = STDOUT_FILENO, .ours = answer->writer.get()},
+                                       {.number = STDERR_FILENO}},
+                       .group = ChildProgram::Group::kOwnSession,
+                       .blockedSignals = {SIGTERM, SIGINT, SIGHUP, SIGQUIT}};
   if (daemon.pid != 0) {
-    keeper.command.insert(keeper.command.end(), {std::to_string(daemon.pid), daemon.startTime});
+    program.command.insert(program.command.end(), {std::to_string(daemon.pid), daemon.startTime});
   }
-  if (const int error = startApart(keeper, pid_)) {
-    pid_ = 0;
-    return failed + errnoText(error);
-  }
-  whileWeLive_ = std::move(life->writing);
+  auto started = ChildProcess::start(program);
+  if (!started) return started.error().message;
+  keeper_ = *std::move(started);
+  whileWeLive_ = std::move(life->writer);
   // Our copy of the writing end must go, or the end of the keeper would not end the reading.
-  answer->writing.reset();
-  const std::string line = readLine(answer->reading.get(), kAnswersWithin);
+  answer->writer.reset();
+  const std::string line = readLine(answer->reader.get(), kAnswersWithin);
   const std::string_view text = line;
   const auto parsed = std::from_chars(text.data(), text.data() + text.size(), daemon.pid);
   const auto numberEnd = static_cast<std::size_t>(parsed.ptr - text.data());
@@ -98,7 +88,7 @@ std::optional<std::string> TracerKeeper::launch(const Ward& ward, DaemonProcess&
     return std::nullopt;
   }
   release();
-  return line.empty() ? program + " does not answer" : line;
+  return line.empty() ? path + " does not answer" : line;
 }
 
 std::optional<std::string> TracerKeeper::start(const Ward& ward, DaemonProcess& daemon) {
@@ -121,14 +111,11 @@ void TracerKeeper::awaitEarlier(const std::filesystem::path& noteFile, milliseco
 }
 
 bool TracerKeeper::release() {
-  const pid_t pid = std::exchange(pid_, 0);
   whileWeLive_.reset();
-  if (pid == 0) return false;
-  int status = 0;
-  while (::waitpid(pid, &status, 0) < 0) {
-    if (errno != EINTR) return false;
-  }
-  return WIFEXITED(status);
+  if (!keeper_) return false;
+  const ChildEnd end = keeper_->wait();
+  keeper_.reset();
+  return end.status >= 0;
 }
 
 }  // namespace halvox::platform::linux_

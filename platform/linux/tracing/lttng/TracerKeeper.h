@@ -5,8 +5,7 @@
 #include <optional>
 #include <string>
 
-#include <sys/types.h>
-
+#include "platform/linux/base/ChildProcess.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/tracing/lttng/DaemonProcess.h"
 
@@ -51,7 +50,7 @@ class TracerKeeper {
  private:
   [[nodiscard]] std::optional<std::string> launch(const Ward& ward, DaemonProcess& daemon);
 
-  pid_t pid_ = 0;
+  std::optional<ChildProcess> keeper_;
   UniqueFd whileWeLive_;  // the keeper sees when this is closed
 };
 

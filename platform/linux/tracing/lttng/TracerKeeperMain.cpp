@@ -27,6 +27,7 @@
 #include <sys/file.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ChildProcess.h"
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/tracing/lttng/DaemonProcess.h"
@@ -67,12 +68,17 @@ void awaitEndOfService() {
 }
 
 std::optional<DaemonProcess> startDaemon(std::string& failure) {
-  pid_t pid = 0;
-  if (const int error = startApart({.command = {"lttng-sessiond", "--no-kernel"}}, pid)) {
-    failure = "cannot start lttng-sessiond: " + errnoText(error);
+  // A session of its own, as the keeper has: a terminal must not end the daemon first.
+  auto started = ChildProcess::start({.command = {"lttng-sessiond", "--no-kernel"},
+                                      .descriptors = {{.number = STDIN_FILENO},
+                                                      {.number = STDOUT_FILENO},
+                                                      {.number = STDERR_FILENO}},
+                                      .group = ChildProgram::Group::kOwnSession});
+  if (!started) {
+    failure = started.error().message;
     return std::nullopt;
   }
-  return DaemonProcess::withNumber(pid);
+  return DaemonProcess::withNumber(started->detach());
 }
 
 // Destroys the service's sessions. Returns whether the daemon has sessions of others.

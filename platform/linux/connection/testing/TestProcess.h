@@ -6,12 +6,13 @@
 
 #include <sys/types.h>
 
+#include "platform/linux/base/ChildProcess.h"
 #include "platform/linux/base/UniqueHandle.h"
 
 namespace halvox::platform::linux_ {
 
-// A process of the test's own, killed at the latest when this goes.
-class ChildProcess {
+// A program that a test runs. The destructor kills it if it has not ended.
+class TestProcess {
  public:
   struct Options {
     std::vector<std::string> environment{};  // beside the test's own, NAME=value
@@ -19,15 +20,14 @@ class ChildProcess {
   };
 
   // Throws when the program cannot be started. Its standard output can be read by firstLine().
-  ChildProcess(const std::vector<std::string>& command, const Options& options);
-  explicit ChildProcess(const std::vector<std::string>& command)
-      : ChildProcess(command, Options()) {}
-  ChildProcess(const ChildProcess&) = delete;
-  ChildProcess& operator=(const ChildProcess&) = delete;
-  ~ChildProcess();
+  TestProcess(const std::vector<std::string>& command, const Options& options);
+  explicit TestProcess(const std::vector<std::string>& command) : TestProcess(command, Options()) {}
+  TestProcess(const TestProcess&) = delete;
+  TestProcess& operator=(const TestProcess&) = delete;
+  ~TestProcess() = default;
 
-  [[nodiscard]] pid_t pid() const { return pid_; }
-  void signal(int number) const;
+  [[nodiscard]] pid_t pid() const { return child_->pid(); }
+  void signal(int number) const { child_->signal(number); }
   // What the child prints first, up to the end of the line.
   std::string firstLine();
   // Its exit status, once it has ended; none when a signal ended it or it does not end in time.
@@ -38,10 +38,8 @@ class ChildProcess {
   [[nodiscard]] double processorSeconds() const;
 
  private:
-  pid_t pid_ = -1;
-  bool ended_ = false;
-  int status_ = 0;
   UniqueFd output_;
+  std::optional<ChildProcess> child_;  // always there
 };
 
 }  // namespace halvox::platform::linux_

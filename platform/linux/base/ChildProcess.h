@@ -1,0 +1,121 @@
+#pragma once
+
+#include <chrono>
+#include <cstdint>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include <sys/types.h>
+
+#include "platform/linux/base/Result.h"
+#include "platform/linux/base/UniqueHandle.h"
+
+namespace halvox::platform::linux_ {
+
+// A program to start as a child process, without a shell.
+struct ChildProgram {
+  // What the child has as descriptor `number`: this process's `ours`, or /dev/null.
+  struct Descriptor {
+    static constexpr int kNull = -1;
+    int number;
+    int ours = kNull;
+  };
+  // Which descriptors the child has besides those in `descriptors`.
+  enum class OtherDescriptors : std::uint8_t {
+    kWithoutCloseOnExec,  // those that are not to be closed on exec, the standard streams included
+    kClosed               // none above the largest number in `descriptors`
+  };
+  // What the child is a member of. A group of its own lets one signal reach all that it starts. A
+  // session of its own also keeps the signals of our terminal away from it.
+  enum class Group : std::uint8_t { kOurs, kOwnGroup, kOwnSession };
+  // This program's threads block all signals and ignore some, and another program that inherits
+  // this may not end when it should. Inherit them only to hand on what our own caller set, such as
+  // nohup.
+  enum class Signals : std::uint8_t { kReset, kInherited };
+
+  std::vector<std::string> command;  // the program is searched for in PATH unless it has a slash
+  std::optional<std::vector<std::string>> environment{};  // NAME=value; ours if there is none
+  std::vector<Descriptor> descriptors{};                  // in any order, and of any numbers
+  OtherDescriptors otherDescriptors = OtherDescriptors::kWithoutCloseOnExec;
+  Group group = Group::kOurs;
+  Signals signals = Signals::kReset;
+  std::vector<int> blockedSignals{};  // of reset ones, those that the child starts with blocked
+};
+
+// How a child process ended.
+struct ChildEnd {
+  int status = -1;  // of its exit; -1 after a signal
+  int signal = 0;   // that ended it; 0 after an exit
+
+  [[nodiscard]] bool isSuccess() const { return status == 0; }
+  // "ended with status 3" or "killed by signal 15"
+  [[nodiscard]] std::string text() const;
+};
+
+// A running child process, which this object ends and reaps:
+//
+//   start() --> running --waitUntil(), wait(), kill()--> ended
+//
+// The destructor kills a child that runs. A signal goes to the number of the child, which is its
+// own until it is reaped; afterwards this object sends none, since another process may have the
+// number. Movable; one thread at a time may use it.
+class ChildProcess {
+ public:
+  using Clock = std::chrono::steady_clock;
+
+  // The code is an errno, ENOENT if there is no such program; the message is
+  // "cannot start PROGRAM: " with the errno's text.
+  [[nodiscard]] static Result<ChildProcess, int> start(const ChildProgram& program);
+
+  ChildProcess(ChildProcess&& other) noexcept;
+  ChildProcess& operator=(ChildProcess&& other) noexcept;
+  ~ChildProcess() { kill(); }
+
+  // 0 once the child is reaped, or was detached.
+  [[nodiscard]] pid_t pid() const { return pid_; }
+  // Readable (poll) when the child has ended, so that it can be waited for together with others.
+  // Owned by this object; -1 if the process had no free descriptor.
+  [[nodiscard]] int descriptor() const { return descriptor_.get(); }
+
+  // Sends a signal to the child, or to all in its group if it has one of its own. Does nothing
+  // after the end.
+  void signal(int number) const;
+  void signalGroup(int number) const;
+
+  // Waits until the child ends, without a busy loop, at most until `deadline`. Returns std::nullopt
+  // if it is still running then.
+  [[nodiscard]] std::optional<ChildEnd> waitUntil(Clock::time_point deadline);
+  // Returns std::nullopt if the child is running.
+  [[nodiscard]] std::optional<ChildEnd> poll() { return waitUntil(Clock::time_point::min()); }
+  // Waits until the child ends.
+  ChildEnd wait();
+  // Sends SIGKILL to the child, and to its group if it has one of its own, and waits for the end.
+  // After the end it returns what the child ended with.
+  ChildEnd kill();
+
+  // Gives the child up: it keeps running. The caller, or nobody, waits for the process returned.
+  [[nodiscard]] pid_t detach();
+
+ private:
+  ChildProcess(pid_t pid, ChildProgram::Group group);
+  [[nodiscard]] bool reap(int options);
+
+  pid_t pid_ = 0;
+  ChildProgram::Group group_ = ChildProgram::Group::kOurs;
+  UniqueFd descriptor_;
+  ChildEnd end_;
+};
+
+// Both ends of a pipe, closed on exec. The code is an errno.
+struct Pipe {
+  UniqueFd reader;
+  UniqueFd writer;
+};
+[[nodiscard]] Result<Pipe, int> makePipe();
+
+// Returns our own environment as a child gets it, NAME=value, with `changes` in place of the
+// variables of the same names.
+[[nodiscard]] std::vector<std::string> environmentWith(const std::vector<std::string>& changes);
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,86 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <type_traits>
+#include <utility>
+#include <variant>
+
+namespace halvox::platform::linux_ {
+
+// Why something could not be done: `code` for the caller, which decides by it, and `message` for
+// people, which names the object and the system's error ("/etc/x: Permission denied"). If nobody
+// decides by a code, Code is void and there is only the message.
+template <typename Code = void>
+struct Failure {
+  Code code;
+  std::string message;
+};
+template <>
+struct Failure<void> {
+  std::string message;
+};
+
+// A value, or why there is none. The caller must look before it takes either:
+//
+//   Result<Settings> settings = readSettings(file);
+//   if (!settings) return settings.error();
+//   use(*settings);
+//
+// To take the other one ends the process. The members are those of C++23's std::expected, which
+// this becomes an alias of one day; docs/decisions/0009-results.md says why it is our own until
+// then.
+template <typename Value, typename Code = void>
+class [[nodiscard]] Result {
+ public:
+  using Error = Failure<Code>;
+
+  // Implicit, so that a function returns either by its own name. What converts to a value does so
+  // here too: std::nullopt where the value is a std::optional.
+  template <typename Source = Value>
+  requires(std::is_convertible_v<Source, Value> &&
+           !std::is_same_v<std::remove_cvref_t<Source>, Result> &&
+           !std::is_same_v<std::remove_cvref_t<Source>, Error>)
+      Result(Source&& value)  // NOLINT(google-explicit-constructor)
+      : state_(std::in_place_index<0>, std::forward<Source>(value)) {}
+  Result(Error error)  // NOLINT(google-explicit-constructor)
+      : state_(std::in_place_index<1>, std::move(error)) {}
+
+  [[nodiscard]] bool has_value() const noexcept { return state_.index() == 0; }
+  explicit operator bool() const noexcept { return has_value(); }
+
+  [[nodiscard]] Value& operator*() & noexcept { return std::get<0>(state_); }
+  [[nodiscard]] const Value& operator*() const& noexcept { return std::get<0>(state_); }
+  [[nodiscard]] Value&& operator*() && noexcept { return std::get<0>(std::move(state_)); }
+  [[nodiscard]] Value* operator->() noexcept { return &std::get<0>(state_); }
+  [[nodiscard]] const Value* operator->() const noexcept { return &std::get<0>(state_); }
+
+  [[nodiscard]] Error& error() & noexcept { return std::get<1>(state_); }
+  [[nodiscard]] const Error& error() const& noexcept { return std::get<1>(state_); }
+  [[nodiscard]] Error&& error() && noexcept { return std::get<1>(std::move(state_)); }
+
+ private:
+  std::variant<Value, Error> state_;
+};
+
+// Nothing, or why it could not be done. `return {};` is success.
+template <typename Code>
+class [[nodiscard]] Result<void, Code> {
+ public:
+  using Error = Failure<Code>;
+
+  Result() = default;
+  Result(Error error) : error_(std::move(error)) {}  // NOLINT(google-explicit-constructor)
+
+  [[nodiscard]] bool has_value() const noexcept { return !error_.has_value(); }
+  explicit operator bool() const noexcept { return has_value(); }
+
+  [[nodiscard]] Error& error() & noexcept { return error_.value(); }
+  [[nodiscard]] const Error& error() const& noexcept { return error_.value(); }
+  [[nodiscard]] Error&& error() && noexcept { return std::move(error_).value(); }
+
+ private:
+  std::optional<Error> error_;
+};
+
+}  // namespace halvox::platform::linux_
