@@ -2,11 +2,11 @@
 
 #include <algorithm>
 #include <array>
-#include <csignal>
 #include <utility>
 
-#include <pthread.h>
 #include <sys/eventfd.h>
+
+#include "platform/linux/base/ThreadSetup.h"
 
 namespace halvox::client {
 namespace {
@@ -19,23 +19,6 @@ constexpr std::chrono::seconds kFarewell{1};
 constexpr std::chrono::milliseconds kPauseWithoutWakeUp{50};
 // Stands for "wait for ever": larger durations could overflow the clock's time points.
 constexpr std::chrono::hours kLongestWait{24 * 365};
-
-// Blocks all signals while a thread is made, because threads inherit the signal mask. The program's
-// signals must go to the program's own threads.
-class SignalsBlocked {
- public:
-  SignalsBlocked() {
-    sigset_t all;
-    sigfillset(&all);
-    pthread_sigmask(SIG_SETMASK, &all, &previous_);
-  }
-  ~SignalsBlocked() { pthread_sigmask(SIG_SETMASK, &previous_, nullptr); }
-  SignalsBlocked(const SignalsBlocked&) = delete;
-  SignalsBlocked& operator=(const SignalsBlocked&) = delete;
-
- private:
-  sigset_t previous_{};
-};
 
 Options withDefaults(Options options) {
   options.requestTimeout =
@@ -57,7 +40,8 @@ ClientWorker::ClientWorker(Options options)
       wakeUp_(eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)),
       watch_(places_),
       pause_(options_.reconnectMin) {
-  const SignalsBlocked blocked;
+  // The program's signals must go to its own threads, and a thread inherits the signal mask.
+  const platform::linux_::SignalsBlocked blocked;
   thread_ = std::jthread([this] { run(); });
 }
 
@@ -156,7 +140,7 @@ void ClientWorker::wake() const {
 }
 
 void ClientWorker::run() {
-  pthread_setname_np(pthread_self(), "halvox-client");
+  platform::linux_::setUpThread("halvox-client");
   while (!isEnding()) {
     giveUpWaitingIfOverflowed();
     notifyNewHandler();

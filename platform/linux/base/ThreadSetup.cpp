@@ -1,7 +1,6 @@
 #include "platform/linux/base/ThreadSetup.h"
 
 #include <algorithm>
-#include <csignal>
 #include <string>
 
 #include <pthread.h>
@@ -11,19 +10,27 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// How much nicer than the main thread: five steps leave about a third of a processor to a thread
-// that another one wants too, ten about a tenth. Neither starves, so a lock that such a thread
-// holds for a few instructions is given back soon.
-int nicenessOf(QualityOfService quality) {
-  switch (quality) {
-    case QualityOfService::kUserInteractive:
+// Five steps leave about a third of a processor to a thread that another one wants too, ten about a
+// tenth. Neither starves, so a lock that such a thread holds for a few instructions is released
+// soon.
+int stepsBelowMainThread(ThreadPriority priority) {
+  switch (priority) {
+    case ThreadPriority::kNormal:
       return 0;
-    case QualityOfService::kUtility:
+    case ThreadPriority::kUtility:
       return 5;
-    case QualityOfService::kBackground:
+    case ThreadPriority::kBackground:
       return 10;
   }
   return 0;
+}
+
+sigset_t blockAllSignals() {
+  sigset_t all;
+  sigset_t previous;
+  ::sigfillset(&all);
+  ::pthread_sigmask(SIG_SETMASK, &all, &previous);
+  return previous;
 }
 
 }  // namespace
@@ -35,20 +42,22 @@ void setUpThread(std::string_view label) {
     label.remove_prefix(dot == std::string_view::npos ? label.size() - kLongestName : dot + 1);
   }
   ::pthread_setname_np(::pthread_self(), std::string(label).c_str());
-  sigset_t all;
-  ::sigfillset(&all);
-  ::pthread_sigmask(SIG_BLOCK, &all, nullptr);
+  blockAllSignals();
 }
 
-void setUpThread(std::string_view label, QualityOfService quality) {
+void setUpThread(std::string_view label, ThreadPriority priority) {
   constexpr int kLowestPriority = 19;
   setUpThread(label);
-  const int steps = nicenessOf(quality);
+  const int steps = stepsBelowMainThread(priority);
   if (steps == 0) return;
-  // Of Linux: an ID of a process is that of its main thread, and each thread has its own niceness.
+  // On Linux the ID of a process is that of its main thread, and each thread has its own niceness.
   const int mainThread = ::getpriority(PRIO_PROCESS, static_cast<id_t>(::getpid()));
   ::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()),
                 std::min(mainThread + steps, kLowestPriority));
 }
+
+SignalsBlocked::SignalsBlocked() : previous_(blockAllSignals()) {}
+
+SignalsBlocked::~SignalsBlocked() { ::pthread_sigmask(SIG_SETMASK, &previous_, nullptr); }
 
 }  // namespace halvox::platform::linux_

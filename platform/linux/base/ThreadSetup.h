@@ -1,18 +1,39 @@
 #pragma once
 
+#include <csignal>
+#include <cstdint>
 #include <string_view>
-
-#include "platform/dispatch.h"
 
 namespace halvox::platform::linux_ {
 
-// What each thread of the adapters does first: takes the name that tools show (of a dotted label
-// the last words that fit into 15 bytes) and leaves all signals to the main thread.
+// How much a thread gives way to those that requests wait for.
+enum class ThreadPriority : std::uint8_t {
+  kNormal,
+  kUtility,    // 5 steps of niceness below the main thread
+  kBackground  // 10 steps below it
+};
+
+// What each thread of ours does first. It takes the name that tools show: of a dotted label the
+// last words that fit into 15 bytes. It leaves all signals to the main thread.
 void setUpThread(std::string_view label);
 
-// The same for a thread that works at a quality of service: utility and background work give way to
-// requests. Lowers the priority of the calling thread, for good, by 5 or 10 steps of niceness below
-// the main thread. Nothing may wait on such a thread that must not be as slow.
-void setUpThread(std::string_view label, QualityOfService quality);
+// The same, and lowers the priority of the calling thread. A thread cannot raise it again. Nothing
+// that must be fast may wait for such a thread.
+void setUpThread(std::string_view label, ThreadPriority priority);
+
+// Blocks all signals for the calling thread while it lives. A thread inherits the signal mask of
+// the one that creates it, so one that is created meanwhile never takes a signal, not even before
+// setUpThread(). A library needs this where it creates a thread in a program of others; in our own
+// programs the main thread handles the signals of a thread that has just begun as well.
+class SignalsBlocked {
+ public:
+  SignalsBlocked();
+  ~SignalsBlocked();
+  SignalsBlocked(const SignalsBlocked&) = delete;
+  SignalsBlocked& operator=(const SignalsBlocked&) = delete;
+
+ private:
+  sigset_t previous_{};
+};
 
 }  // namespace halvox::platform::linux_

@@ -2,8 +2,8 @@
 
 #include <stdexcept>
 
-#include "platform/linux/base/ThreadSetup.h"
 #include "platform/linux/dispatch/BatchedTurns.h"
+#include "platform/linux/dispatch/ThreadPriorities.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -95,7 +95,7 @@ bool OwnThreadQueue::waitForEnd(std::chrono::steady_clock::time_point deadline) 
 }
 
 void OwnThreadQueue::run() {
-  setUpThread(label_, quality_);
+  setUpThread(label_, priorityFor(quality_));
   const JobRunner::Scope scope(this, label_);
   work();
   end();

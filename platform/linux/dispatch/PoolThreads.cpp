@@ -2,7 +2,7 @@
 
 #include <system_error>
 
-#include "platform/linux/base/ThreadSetup.h"
+#include "platform/linux/dispatch/ThreadPriorities.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -75,7 +75,7 @@ void PoolThreads::discardJobs() {
 }
 
 void PoolThreads::run() {
-  setUpThread(threadName(quality_), quality_);
+  setUpThread(threadName(quality_), priorityFor(quality_));
   context_.run();
   const MutexLock lock(mutex_);
   --running_;

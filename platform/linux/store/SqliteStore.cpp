@@ -6,8 +6,7 @@
 #include <string_view>
 #include <utility>
 
-#include <pthread.h>
-
+#include "platform/linux/base/ThreadSetup.h"
 #include "platform/linux/store/StoreLog.h"
 
 namespace halvox::platform::linux_ {
@@ -70,7 +69,7 @@ void SqliteStore::close() {
 }
 
 void SqliteStore::run() {
-  pthread_setname_np(pthread_self(), "halvox-store");
+  setUpThread("halvox-store");
   maintainWhileIdle();
   const auto takeAll = [this] {
     for (RecordKind* const kind : kinds_) kind->takeQueued();

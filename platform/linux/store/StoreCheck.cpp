@@ -7,11 +7,11 @@
 #include <utility>
 
 #include <linux/ioprio.h>
-#include <pthread.h>
 #include <sys/resource.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ThreadSetup.h"
 #include "platform/linux/store/StoreLog.h"
 #include "platform/linux/store/StoreOpening.h"
 
@@ -89,7 +89,7 @@ std::optional<std::string> StoreCheck::finding() {
 }
 
 void StoreCheck::run(const std::string& file, const StoreExtent& extent, const OnDamage& onDamage) {
-  ::pthread_setname_np(::pthread_self(), "halvox-check");
+  setUpThread("halvox-check");
   giveWayToOthers();
   kLog.info("checking ", file,
             " in the background because the last run did not close it, or not check it to the end");

@@ -44,7 +44,7 @@ bool CallbackThread::provideThread() {
 }
 
 void CallbackThread::run() {
-  setUpThread("link callbacks", QualityOfService::kUtility);
+  setUpThread("link callbacks", ThreadPriority::kUtility);
   while (true) {
     Callback next;
     {

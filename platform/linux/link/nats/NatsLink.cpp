@@ -229,7 +229,7 @@ void NatsLink::waitForChange() {
 }
 
 void NatsLink::run() {
-  setUpThread("com.tarno.halvox.link", QualityOfService::kUtility);
+  setUpThread("com.tarno.halvox.link", ThreadPriority::kUtility);
   while (true) {
     Step step = Step::kWait;
     {
