@@ -17,18 +17,19 @@ namespace {
 using platform::Dictionary;
 using platform::Value;
 using platform::linux_::appendEscaped;
+using platform::linux_::Failure;
 using platform::linux_::isNestedTooDeep;
 using platform::linux_::isUtf8;
 using platform::linux_::kLargestPreferenceFile;
 using platform::linux_::nextUtf8;
 using platform::linux_::parsePreferences;
-using platform::linux_::PreferenceFileError;
+using platform::linux_::Result;
 using platform::linux_::shownName;
 using platform::linux_::toDictionary;
 using platform::linux_::toValue;
 using platform::linux_::Utf8Step;
 
-using Edited = std::variant<std::string, PreferenceFileError>;
+using Edited = Result<std::string>;
 
 // Returns a text as a TOML string on one line.
 std::string quotedText(std::string_view text) {
@@ -101,16 +102,13 @@ class ParsedText {
 
   [[nodiscard]] bool isValid() const { return static_cast<bool>(parsed_); }
   [[nodiscard]] const toml::table& root() const { return parsed_.table(); }
-  [[nodiscard]] PreferenceFileError mistake() const {
-    return std::get<PreferenceFileError>(parsePreferences(text_, file_));
-  }
-  [[nodiscard]] PreferenceFileError refusal(std::string_view key) const {
-    PreferenceFileError error;
-    appendEscaped(error.description, file_.native(), 4096);
-    error.description +=
-        ": " + shownName(key) +
-        " is a table, or cannot be changed alone where it is; expected KEY = VALUE "
-        "on its own lines; edit the file instead";
+  [[nodiscard]] Failure<> mistake() const { return parsePreferences(text_, file_).error(); }
+  [[nodiscard]] Failure<> refusal(std::string_view key) const {
+    Failure<> error;
+    appendEscaped(error.message, file_.native(), 4096);
+    error.message += ": " + shownName(key) +
+                     " is a table, or cannot be changed alone where it is; expected KEY = VALUE "
+                     "on its own lines; edit the file instead";
     return error;
   }
   [[nodiscard]] std::size_t begin(const toml::node& node) const {
@@ -145,12 +143,11 @@ class ParsedText {
 Edited verified(std::string text, const Dictionary& expected, const ParsedText& before,
                 std::string_view key, const std::filesystem::path& file) {
   const auto after = parsePreferences(text, file);
-  const auto* values = std::get_if<Dictionary>(&after);
-  if (values == nullptr || *values != expected) return before.refusal(key);
+  if (!after || *after != expected) return before.refusal(key);
   if (text.size() > kLargestPreferenceFile) {
-    return PreferenceFileError{file.native() + ": expected at most " +
-                               std::to_string(kLargestPreferenceFile) + " bytes, would have " +
-                               std::to_string(text.size())};
+    return Failure<>{file.native() + ": expected at most " +
+                     std::to_string(kLargestPreferenceFile) + " bytes, would have " +
+                     std::to_string(text.size())};
   }
   return text;
 }
@@ -165,9 +162,8 @@ std::string withNewLine(std::string_view text, std::size_t place, const std::str
 
 }  // namespace
 
-std::variant<PreferenceValue, PreferenceFileError> parsePreferenceValue(std::string_view text,
-                                                                        ValueForm form) {
-  if (!isUtf8(text)) return PreferenceFileError{"VALUE: expected UTF-8 text, found other bytes"};
+Result<PreferenceValue> parsePreferenceValue(std::string_view text, ValueForm form) {
+  if (!isUtf8(text)) return Failure<>{"VALUE: expected UTF-8 text, found other bytes"};
   if (form == ValueForm::kTomlOrString && !isNestedTooDeep(text)) {
     constexpr std::string_view kKey = "v = ";
     const std::string line = std::string(kKey) + std::string(text);

@@ -3,8 +3,8 @@
 #include <filesystem>
 #include <string>
 #include <string_view>
-#include <variant>
 
+#include "platform/linux/base/Result.h"
 #include "platform/linux/settings/PreferenceFile.h"
 #include "platform/value.h"
 
@@ -28,17 +28,17 @@ enum class ValueForm : unsigned char { kTomlOrString, kString };
 // Interprets what a user wrote as a value. Text that is one TOML value (7, true, "text", [1, 2],
 // 2026-03-01) is that value; any other text, or every text with kString, is a string. Returns an
 // error if the text is not UTF-8.
-std::variant<PreferenceValue, platform::linux_::PreferenceFileError> parsePreferenceValue(
-    std::string_view text, ValueForm form);
+platform::linux_::Result<PreferenceValue> parsePreferenceValue(std::string_view text,
+                                                               ValueForm form);
 
 // Returns the text with a top-level key set to a value. Changes the key where it stands, or adds a
 // line after the other top-level keys. `file` is only for error messages.
-std::variant<std::string, platform::linux_::PreferenceFileError> withPreference(
-    std::string_view text, std::string_view key, const PreferenceValue& value,
-    const std::filesystem::path& file);
+platform::linux_::Result<std::string> withPreference(std::string_view text, std::string_view key,
+                                                     const PreferenceValue& value,
+                                                     const std::filesystem::path& file);
 // Returns the text without a top-level key and its lines. Returns the same text if it has no such
 // key.
-std::variant<std::string, platform::linux_::PreferenceFileError> withoutPreference(
-    std::string_view text, std::string_view key, const std::filesystem::path& file);
+platform::linux_::Result<std::string> withoutPreference(std::string_view text, std::string_view key,
+                                                        const std::filesystem::path& file);
 
 }  // namespace halvox::tools

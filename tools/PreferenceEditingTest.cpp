@@ -11,22 +11,19 @@ using platform::Dictionary;
 using platform::Value;
 using platform::linux_::kLargestPreferenceFile;
 using platform::linux_::parsePreferences;
-using platform::linux_::PreferenceFileError;
 
 PreferenceValue value(std::string_view text, ValueForm form = ValueForm::kTomlOrString) {
-  return std::get<PreferenceValue>(parsePreferenceValue(text, form));
+  return *parsePreferenceValue(text, form);
 }
 
 std::string set(std::string_view text, std::string_view key, std::string_view to) {
   const auto edited = withPreference(text, key, value(to), "/p/f.toml");
-  const auto* error = std::get_if<PreferenceFileError>(&edited);
-  return error == nullptr ? std::get<std::string>(edited) : error->description;
+  return edited ? *edited : edited.error().message;
 }
 
 std::string unset(std::string_view text, std::string_view key) {
   const auto edited = withoutPreference(text, key, "/p/f.toml");
-  const auto* error = std::get_if<PreferenceFileError>(&edited);
-  return error == nullptr ? std::get<std::string>(edited) : error->description;
+  return edited ? *edited : edited.error().message;
 }
 
 constexpr std::string_view kFile = R"(# Settings of the kitchen.
@@ -57,7 +54,7 @@ TEST(PreferenceEditingTest, EverythingElseIsAString) {
     const PreferenceValue parsed = value(text);
     EXPECT_EQ(parsed.value, Value(text));
     const auto read = parsePreferences("v = " + parsed.text, "");
-    EXPECT_EQ(std::get<Dictionary>(read), (Dictionary{{"v", text}}));
+    EXPECT_EQ(*read, (Dictionary{{"v", text}}));
   }
 }
 
@@ -67,8 +64,7 @@ TEST(PreferenceEditingTest, AStringCanBeForced) {
 }
 
 TEST(PreferenceEditingTest, BytesThatAreNoTextAreRefused) {
-  EXPECT_TRUE(std::holds_alternative<PreferenceFileError>(
-      parsePreferenceValue("a\xff", ValueForm::kString)));
+  EXPECT_FALSE(parsePreferenceValue("a\xff", ValueForm::kString));
 }
 
 TEST(PreferenceEditingTest, SettingChangesNothingButTheValue) {

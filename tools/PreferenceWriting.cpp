@@ -19,16 +19,17 @@ namespace halvox::tools {
 namespace {
 
 using platform::linux_::errnoText;
+using platform::linux_::Failure;
 using platform::linux_::linkedFiles;
-using platform::linux_::PreferenceFileError;
 using platform::linux_::PreferenceText;
 using platform::linux_::readPreferenceText;
+using platform::linux_::Result;
 using platform::linux_::UniqueFd;
 
 // Readable by everyone, as far as the umask allows.
 constexpr mode_t kModeOfNewFiles = 0644;
 
-PreferenceFileError failure(const std::filesystem::path& path, int error) {
+Failure<> failure(const std::filesystem::path& path, int error) {
   return {path.native() + ": " + errnoText(error)};
 }
 
@@ -72,12 +73,12 @@ mode_t modeOfNewFile() {
   return kModeOfNewFiles & ~mask;
 }
 
-std::optional<PreferenceFileError> replace(const std::filesystem::path& file,
-                                           const std::string& text, mode_t mode, int directory) {
+Result<void> replace(const std::filesystem::path& file, const std::string& text, mode_t mode,
+                     int directory) {
   NewFile made(file);
   if (!made.write(text, mode) || !made.keepAs(file)) return failure(file, errno);
   if (::fsync(directory) != 0) return failure(file.parent_path(), errno);
-  return std::nullopt;
+  return {};
 }
 
 // Locks the directory. Returns false when that fails or takes longer than `patience`.
@@ -106,9 +107,8 @@ std::filesystem::path target(const std::filesystem::path& file) {
 
 }  // namespace
 
-std::optional<PreferenceFileError> changePreferenceFile(const std::filesystem::path& named,
-                                                        const PreferenceEdit& edit,
-                                                        std::chrono::milliseconds patience) {
+Result<void> changePreferenceFile(const std::filesystem::path& named, const PreferenceEdit& edit,
+                                  std::chrono::milliseconds patience) {
   const std::filesystem::path file = target(named);
   const std::filesystem::path directory = file.parent_path();
   std::error_code error;
@@ -118,19 +118,18 @@ std::optional<PreferenceFileError> changePreferenceFile(const std::filesystem::p
   if (!held) return failure(directory, errno);
   if (!lock(held.get(), patience)) {
     if (errno != EWOULDBLOCK) return failure(directory, errno);
-    return PreferenceFileError{directory.native() +
-                               ": another program has locked this directory; try again later"};
+    return Failure<>{directory.native() +
+                     ": another program has locked this directory; try again later"};
   }
 
   auto content = readPreferenceText(file);
-  if (auto* problem = std::get_if<PreferenceFileError>(&content)) return std::move(*problem);
-  const auto& old = std::get<std::optional<PreferenceText>>(content);
+  if (!content) return std::move(content).error();
+  const std::optional<PreferenceText>& old = *content;
   const std::string before = old.has_value() ? old->text : std::string();
   auto edited = edit(before, file);
-  if (auto* problem = std::get_if<PreferenceFileError>(&edited)) return std::move(*problem);
-  const std::string& after = std::get<std::string>(edited);
-  if (after == before) return std::nullopt;
-  return replace(file, after, old.has_value() ? old->mode : modeOfNewFile(), held.get());
+  if (!edited) return std::move(edited).error();
+  if (*edited == before) return {};
+  return replace(file, *edited, old.has_value() ? old->mode : modeOfNewFile(), held.get());
 }
 
 }  // namespace halvox::tools

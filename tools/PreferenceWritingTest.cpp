@@ -11,15 +11,16 @@
 namespace halvox::tools {
 namespace {
 
+using platform::linux_::Failure;
 using platform::linux_::FileSizeLimit;
-using platform::linux_::PreferenceFileError;
+using platform::linux_::Result;
 using platform::linux_::SettingsFixture;
 
 class PreferenceWritingTest : public SettingsFixture {
  protected:
   static PreferenceEdit to(std::string text) {
     return [text = std::move(text)](std::string_view, const std::filesystem::path&) {
-      return std::variant<std::string, PreferenceFileError>(text);
+      return Result<std::string>(text);
     };
   }
   std::size_t filesBeside() const {
@@ -36,7 +37,7 @@ class PreferenceWritingTest : public SettingsFixture {
 };
 
 TEST_F(PreferenceWritingTest, MakesFileAndDirectories) {
-  EXPECT_FALSE(changePreferenceFile(file_, to("a = 1\n")).has_value());
+  EXPECT_TRUE(changePreferenceFile(file_, to("a = 1\n")));
 
   EXPECT_EQ(read(file_), "a = 1\n");
   EXPECT_EQ(filesBeside(), 1U);
@@ -47,10 +48,10 @@ TEST_F(PreferenceWritingTest, TheEditSeesWhatIsThere) {
   std::string seen;
   const auto edit = [&seen](std::string_view text, const std::filesystem::path&) {
     seen = text;
-    return std::variant<std::string, PreferenceFileError>(seen + "b = 2\n");
+    return Result<std::string>(seen + "b = 2\n");
   };
 
-  EXPECT_FALSE(changePreferenceFile(file_, edit).has_value());
+  EXPECT_TRUE(changePreferenceFile(file_, edit));
 
   EXPECT_EQ(seen, "a = 1\n");
   EXPECT_EQ(read(file_), "a = 1\nb = 2\n");
@@ -60,7 +61,7 @@ TEST_F(PreferenceWritingTest, KeepsThePermissions) {
   write(file_, "a = 1\n");
   ::chmod(file_.c_str(), 0640);
 
-  EXPECT_FALSE(changePreferenceFile(file_, to("a = 2\n")).has_value());
+  EXPECT_TRUE(changePreferenceFile(file_, to("a = 2\n")));
 
   EXPECT_EQ(modeOf(file_), 0640U);
 }
@@ -70,7 +71,7 @@ TEST_F(PreferenceWritingTest, ALinkStaysALink) {
   std::filesystem::create_directories(file_.parent_path());
   std::filesystem::create_symlink(scratch_ / "real.toml", file_);
 
-  EXPECT_FALSE(changePreferenceFile(file_, to("a = 2\n")).has_value());
+  EXPECT_TRUE(changePreferenceFile(file_, to("a = 2\n")));
 
   EXPECT_TRUE(std::filesystem::is_symlink(file_));
   EXPECT_EQ(read(scratch_ / "real.toml"), "a = 2\n");
@@ -80,7 +81,7 @@ TEST_F(PreferenceWritingTest, ALinkToAFileThatIsMissingStaysALinkToo) {
   std::filesystem::create_directories(file_.parent_path());
   std::filesystem::create_symlink(scratch_ / "elsewhere" / "real.toml", file_);
 
-  EXPECT_FALSE(changePreferenceFile(file_, to("a = 2\n")).has_value());
+  EXPECT_TRUE(changePreferenceFile(file_, to("a = 2\n")));
 
   EXPECT_TRUE(std::filesystem::is_symlink(file_));
   EXPECT_EQ(read(scratch_ / "elsewhere" / "real.toml"), "a = 2\n");
@@ -88,13 +89,13 @@ TEST_F(PreferenceWritingTest, ALinkToAFileThatIsMissingStaysALinkToo) {
 
 TEST_F(PreferenceWritingTest, AFailedWriteLeavesTheOldFileAndNothingElse) {
   write(file_, "a = 1\n");
-  const auto error = [this] {
+  const auto changed = [this] {
     const FileSizeLimit limit(8);
     return changePreferenceFile(file_, to("a = \"much too long\"\n"));
   }();
 
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->description, file_.native() + ": File too large");
+  ASSERT_FALSE(changed);
+  EXPECT_EQ(changed.error().message, file_.native() + ": File too large");
   EXPECT_EQ(read(file_), "a = 1\n");
   EXPECT_EQ(filesBeside(), 1U);
 }
@@ -104,24 +105,24 @@ TEST_F(PreferenceWritingTest, ADirectoryThatStaysLockedIsAnError) {
   const int directory = ::open(file_.parent_path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   ASSERT_EQ(::flock(directory, LOCK_EX), 0);
 
-  const auto error = changePreferenceFile(file_, to("a = 2\n"), std::chrono::milliseconds(20));
+  const auto changed = changePreferenceFile(file_, to("a = 2\n"), std::chrono::milliseconds(20));
   ::close(directory);
 
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->description, file_.parent_path().native() +
-                                    ": another program has locked this directory; try again later");
+  ASSERT_FALSE(changed);
+  EXPECT_EQ(changed.error().message,
+            file_.parent_path().native() +
+                ": another program has locked this directory; try again later");
   EXPECT_EQ(read(file_), "a = 1\n");
 }
 
 TEST_F(PreferenceWritingTest, ARefusedEditLeavesTheFileAlone) {
   write(file_, "a = 1\n");
 
-  const auto error = changePreferenceFile(file_, [](auto, const auto&) {
-    return std::variant<std::string, PreferenceFileError>(PreferenceFileError{"no"});
-  });
+  const auto changed = changePreferenceFile(
+      file_, [](auto, const auto&) { return Result<std::string>(Failure<>{"no"}); });
 
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->description, "no");
+  ASSERT_FALSE(changed);
+  EXPECT_EQ(changed.error().message, "no");
   EXPECT_EQ(read(file_), "a = 1\n");
   EXPECT_EQ(filesBeside(), 1U);
 }
@@ -129,19 +130,19 @@ TEST_F(PreferenceWritingTest, ARefusedEditLeavesTheFileAlone) {
 TEST_F(PreferenceWritingTest, ADirectoryThatCannotBeMadeIsNamed) {
   write(preferences(), "a file");
 
-  const auto error = changePreferenceFile(file_, to("a = 1\n"));
+  const auto changed = changePreferenceFile(file_, to("a = 1\n"));
 
-  ASSERT_TRUE(error.has_value());
-  EXPECT_NE(error->description.find(file_.parent_path().native()), std::string::npos);
+  ASSERT_FALSE(changed);
+  EXPECT_NE(changed.error().message.find(file_.parent_path().native()), std::string::npos);
 }
 
 TEST_F(PreferenceWritingTest, WhatIsNoRegularFileIsLeftAlone) {
   std::filesystem::create_directories(file_.parent_path());
   ASSERT_EQ(::mkfifo(file_.c_str(), 0600), 0);
 
-  const auto error = changePreferenceFile(file_, to("a = 1\n"));
+  const auto changed = changePreferenceFile(file_, to("a = 1\n"));
 
-  ASSERT_TRUE(error.has_value());
+  ASSERT_FALSE(changed);
   EXPECT_TRUE(std::filesystem::is_fifo(file_));
 }
 

@@ -18,7 +18,6 @@ namespace {
 
 using platform::Value;
 using platform::linux_::Configuration;
-using platform::linux_::PreferenceFileError;
 
 std::string shown(const Value& value, bool json) {
   if (!json && value.isString()) return harmlessText(value.string());
@@ -34,10 +33,8 @@ ExitStatus nothingThere(const Preferences& request, const Complaint& complain) {
 ExitStatus get(const Preferences& request, const std::filesystem::path& file, bool json,
                std::ostream& out, const Complaint& complain) {
   const auto content = platform::linux_::readPreferences(file);
-  if (const auto* error = std::get_if<PreferenceFileError>(&content)) {
-    return complain(ExitStatus::kCannotWrite, error->description);
-  }
-  const auto& values = std::get<platform::Dictionary>(content);
+  if (!content) return complain(ExitStatus::kCannotWrite, content.error().message);
+  const platform::Dictionary& values = *content;
   if (!request.key.has_value()) {
     if (json) {
       out << shown(values, json) << '\n';
@@ -56,8 +53,8 @@ ExitStatus get(const Preferences& request, const std::filesystem::path& file, bo
 
 ExitStatus change(const std::filesystem::path& file, const PreferenceEdit& edit,
                   const Complaint& complain) {
-  const auto error = changePreferenceFile(file, edit);
-  if (error.has_value()) return complain(ExitStatus::kCannotWrite, error->description);
+  const auto changed = changePreferenceFile(file, edit);
+  if (!changed) return complain(ExitStatus::kCannotWrite, changed.error().message);
   return ExitStatus::kDone;
 }
 
@@ -65,13 +62,11 @@ ExitStatus set(const Preferences& request, const std::filesystem::path& file,
                const Complaint& complain) {
   auto parsed = parsePreferenceValue(
       *request.value, request.isString ? ValueForm::kString : ValueForm::kTomlOrString);
-  if (const auto* error = std::get_if<PreferenceFileError>(&parsed)) {
-    return complain(ExitStatus::kBadArguments, error->description);
-  }
+  if (!parsed) return complain(ExitStatus::kBadArguments, parsed.error().message);
   return change(
       file,
       [&](std::string_view text, const std::filesystem::path& named) {
-        return withPreference(text, *request.key, std::get<PreferenceValue>(parsed), named);
+        return withPreference(text, *request.key, *parsed, named);
       },
       complain);
 }
@@ -86,8 +81,7 @@ ExitStatus unset(const Preferences& request, const std::filesystem::path& file,
       file,
       [&](std::string_view text, const std::filesystem::path& named) {
         auto edited = withoutPreference(text, *request.key, named);
-        const auto* result = std::get_if<std::string>(&edited);
-        wasThere = result == nullptr || *result != text;
+        wasThere = !edited || *edited != text;
         return edited;
       },
       complain);

@@ -65,8 +65,8 @@ struct Contents {
 // What a snapshot tells of itself, or what is wrong with it.
 std::variant<Contents, std::string> readContents(const fs::path& file) {
   auto read = readSnapshotFiles(file, {kSignatureName, kManifestName});
-  if (auto* error = std::get_if<SnapshotReadError>(&read)) return std::move(error->description);
-  const auto& texts = std::get<std::map<std::string, std::string>>(read);
+  if (!read) return std::move(read).error().message;
+  const std::map<std::string, std::string>& texts = *read;
   Contents contents;
   for (const auto& [name, target] : {std::pair(kSignatureName, &contents.signature),
                                      std::pair(kManifestName, &contents.manifest)}) {
@@ -176,10 +176,8 @@ ExitStatus extractSnapshot(const ExtractSnapshot& request, OutputForm form, std:
   const fs::path directory = request.directory.empty() ? stemOf(file) : request.directory;
   const auto extracted = unpackSnapshot(
       file, directory, request.force ? ExistingFiles::kReplace : ExistingFiles::kRefuse);
-  if (const auto* error = std::get_if<SnapshotReadError>(&extracted)) {
-    return complain(ExitStatus::kRefused, error->description);
-  }
-  for (const std::string& name : std::get<std::vector<std::string>>(extracted)) {
+  if (!extracted) return complain(ExitStatus::kRefused, extracted.error().message);
+  for (const std::string& name : *extracted) {
     const std::string path = (directory / name).native();
     if (form == OutputForm::kJson) {
       out << harmlessJson(toJson(Dictionary{{"file", path}})) << '\n';

@@ -21,12 +21,13 @@ namespace {
 namespace fs = std::filesystem;
 
 using platform::linux_::errnoText;
+using platform::linux_::Failure;
+using platform::linux_::Result;
 using platform::linux_::UniqueFd;
 using platform::linux_::UniqueHandle;
 
 using Reader = UniqueHandle<archive*, archive_read_free>;
 using DiskWriter = UniqueHandle<archive*, archive_write_free>;
-using Failure = std::optional<SnapshotReadError>;
 
 constexpr std::size_t kBlock = 64U << 10U;
 // Above what this program writes, which is 64 MiB before compression by default.
@@ -38,7 +39,7 @@ constexpr const char* kTooLarge = "the archive is too large when unpacked";
 // or wide character") would mislead.
 constexpr int kUnknownFormat = EILSEQ;
 
-SnapshotReadError failed(const fs::path& snapshot, const std::string& why) {
+Failure<> failed(const fs::path& snapshot, const std::string& why) {
   return {snapshot.native() + ": " + why};
 }
 
@@ -52,7 +53,7 @@ class Walk {
  public:
   explicit Walk(const fs::path& snapshot) : snapshot_(snapshot), reader_(archive_read_new()) {}
 
-  [[nodiscard]] Failure open() {
+  [[nodiscard]] Result<void> open() {
     // Opening a pipe would block until somebody writes to it, and libarchive takes an empty name
     // for the standard input.
     struct stat status {};
@@ -65,7 +66,7 @@ class Walk {
     archive_read_support_format_tar(reader_.get());
     archive_read_support_filter_zstd(reader_.get());
     if (archive_read_open_filename(reader_.get(), snapshot_.c_str(), kBlock) == ARCHIVE_OK) {
-      return std::nullopt;
+      return {};
     }
     const int error = archive_errno(reader_.get());
     if (error == kUnknownFormat) return failed(snapshot_, "not a snapshot: unknown file format");
@@ -73,7 +74,7 @@ class Walk {
   }
 
   // Returns the next entry, null at the end of the archive, or an error.
-  [[nodiscard]] std::variant<archive_entry*, SnapshotReadError> next() {
+  [[nodiscard]] Result<archive_entry*> next() {
     archive_entry* entry = nullptr;
     const int result = archive_read_next_header(reader_.get(), &entry);
     if (result == ARCHIVE_EOF) return nullptr;
@@ -94,7 +95,7 @@ class Walk {
   }
 
   // Returns the next piece of the current entry, an empty one at its end, or an error.
-  [[nodiscard]] std::variant<std::string_view, SnapshotReadError> nextPiece() {
+  [[nodiscard]] Result<std::string_view> nextPiece() {
     const la_ssize_t count = archive_read_data(reader_.get(), buffer_.data(), buffer_.size());
     if (count < 0) return failed(snapshot_, textOf(reader_.get()));
     bytes_ += static_cast<std::uint64_t>(count);
@@ -118,27 +119,27 @@ class Walk {
 
 // Calls `take` with every piece of the current entry until it returns an error.
 template <typename Take>
-Failure forEachPiece(Walk& walk, Take take) {
+Result<void> forEachPiece(Walk& walk, Take take) {
   for (;;) {
     auto piece = walk.nextPiece();
-    if (auto* error = std::get_if<SnapshotReadError>(&piece)) return std::move(*error);
-    const auto bytes = std::get<std::string_view>(piece);
-    if (bytes.empty()) return std::nullopt;
-    if (Failure failure = take(bytes)) return failure;
+    if (!piece) return std::move(piece).error();
+    const std::string_view bytes = *piece;
+    if (bytes.empty()) return {};
+    if (Result<void> done = take(bytes); !done) return std::move(done).error();
   }
 }
 
 // Calls `take` with every entry until it returns an error.
 template <typename Take>
-Failure forEachEntry(const fs::path& snapshot, Take take) {
+Result<void> forEachEntry(const fs::path& snapshot, Take take) {
   Walk walk(snapshot);
-  if (Failure failure = walk.open()) return failure;
+  if (Result<void> done = walk.open(); !done) return std::move(done).error();
   for (;;) {
     auto next = walk.next();
-    if (auto* error = std::get_if<SnapshotReadError>(&next)) return std::move(*error);
-    archive_entry* const entry = std::get<archive_entry*>(next);
-    if (entry == nullptr) return std::nullopt;
-    if (Failure failure = take(walk, entry)) return failure;
+    if (!next) return std::move(next).error();
+    archive_entry* const entry = *next;
+    if (entry == nullptr) return {};
+    if (Result<void> done = take(walk, entry); !done) return std::move(done).error();
   }
 }
 
@@ -161,82 +162,81 @@ class WorkingDirectory {
 };
 
 // Validates all entries before anything is unpacked, so that a bad archive leaves nothing behind.
-Failure check(const fs::path& snapshot, const fs::path& directory, ExistingFiles existing) {
-  return forEachEntry(snapshot, [&](Walk&, archive_entry* entry) -> Failure {
+Result<void> check(const fs::path& snapshot, const fs::path& directory, ExistingFiles existing) {
+  return forEachEntry(snapshot, [&](Walk&, archive_entry* entry) -> Result<void> {
     struct stat status {};
     const char* name = archive_entry_pathname(entry);
     if (existing == ExistingFiles::kRefuse && archive_entry_filetype(entry) == AE_IFREG &&
         ::lstat(name, &status) == 0) {
-      return SnapshotReadError{(directory / name).native() + ": the file already exists"};
+      return Failure<>{(directory / name).native() + ": the file already exists"};
     }
-    return std::nullopt;
+    return {};
   });
 }
 
-Failure unpackEntry(archive* disk, Walk& walk, archive_entry* entry, const fs::path& directory) {
+Result<void> unpackEntry(archive* disk, Walk& walk, archive_entry* entry,
+                         const fs::path& directory) {
   const std::string name = archive_entry_pathname(entry);
   const auto diskError = [&] {
     // libarchive's text says which step failed; the system's text says why.
     const int error = archive_errno(disk);
-    return SnapshotReadError{(directory / name).native() + ": " + textOf(disk) +
-                             (error > 0 ? ": " + errnoText(error) : std::string())};
+    return Failure<>{(directory / name).native() + ": " + textOf(disk) +
+                     (error > 0 ? ": " + errnoText(error) : std::string())};
   };
   if (archive_write_header(disk, entry) != ARCHIVE_OK) return diskError();
   if (archive_entry_filetype(entry) == AE_IFREG) {
-    Failure failure = forEachPiece(walk, [&](std::string_view bytes) -> Failure {
+    Result<void> done = forEachPiece(walk, [&](std::string_view bytes) -> Result<void> {
       if (archive_write_data(disk, bytes.data(), bytes.size()) < 0) return diskError();
-      return std::nullopt;
+      return {};
     });
-    if (failure) return failure;
+    if (!done) return done;
   }
   if (archive_write_finish_entry(disk) != ARCHIVE_OK) return diskError();
-  return std::nullopt;
+  return {};
 }
 
 // Unpacks into an existing directory. The process changes to it because libarchive, as it is set up
 // here, refuses absolute names.
-std::variant<std::vector<std::string>, SnapshotReadError> unpack(const fs::path& source,
-                                                                 const fs::path& directory,
-                                                                 ExistingFiles existing) {
+Result<std::vector<std::string>> unpack(const fs::path& source, const fs::path& directory,
+                                        ExistingFiles existing) {
   const WorkingDirectory inside(directory);
   if (inside.error() != 0) return failed(directory, errnoText(inside.error()));
-  if (Failure failure = check(source, directory, existing)) return std::move(*failure);
+  if (Result<void> done = check(source, directory, existing); !done) return std::move(done).error();
   const DiskWriter disk(archive_write_disk_new());
   archive_write_disk_set_options(disk.get(), ARCHIVE_EXTRACT_SECURE_SYMLINKS |
                                                  ARCHIVE_EXTRACT_SECURE_NODOTDOT |
                                                  ARCHIVE_EXTRACT_SECURE_NOABSOLUTEPATHS);
   std::vector<std::string> names;
-  Failure failure = forEachEntry(source, [&](Walk& walk, archive_entry* entry) {
+  Result<void> done = forEachEntry(source, [&](Walk& walk, archive_entry* entry) {
     names.emplace_back(archive_entry_pathname(entry));
     return unpackEntry(disk.get(), walk, entry, directory);
   });
-  if (failure) return std::move(*failure);
+  if (!done) return std::move(done).error();
   return names;
 }
 
 }  // namespace
 
-std::variant<std::map<std::string, std::string>, SnapshotReadError> readSnapshotFiles(
+Result<std::map<std::string, std::string>> readSnapshotFiles(
     const fs::path& snapshot, const std::vector<std::string>& names) {
   std::map<std::string, std::string> texts;
-  Failure failure = forEachEntry(snapshot, [&](Walk& walk, archive_entry* entry) -> Failure {
+  Result<void> done = forEachEntry(snapshot, [&](Walk& walk, archive_entry* entry) -> Result<void> {
     const std::string name = archive_entry_pathname(entry);
-    if (std::ranges::find(names, name) == names.end()) return std::nullopt;
+    if (std::ranges::find(names, name) == names.end()) return {};
     std::string& text = texts[name];
     text.clear();
-    return forEachPiece(walk, [&](std::string_view bytes) -> Failure {
+    return forEachPiece(walk, [&](std::string_view bytes) -> Result<void> {
       text += bytes;
-      if (text.size() <= kMostBytesOfText) return std::nullopt;
+      if (text.size() <= kMostBytesOfText) return {};
       return failed(snapshot, name + " in the archive is too large to be read");
     });
   });
-  if (failure) return std::move(*failure);
+  if (!done) return std::move(done).error();
   return texts;
 }
 
-std::variant<std::vector<std::string>, SnapshotReadError> unpackSnapshot(const fs::path& snapshot,
-                                                                         const fs::path& directory,
-                                                                         ExistingFiles existing) {
+Result<std::vector<std::string>> unpackSnapshot(const fs::path& snapshot, const fs::path& directory,
+                                                ExistingFiles existing) {
   // Fails when the current working directory was deleted.
   std::error_code error;
   const fs::path source = fs::absolute(snapshot, error);
@@ -246,7 +246,7 @@ std::variant<std::vector<std::string>, SnapshotReadError> unpackSnapshot(const f
   if (!isMade && errno != EEXIST) return failed(directory, errnoText(errno));
   auto unpacked = unpack(source, directory, existing);
   // rmdir() removes the directory only while it is empty, so unpacked files stay.
-  if (isMade && unpacked.index() != 0) ::rmdir(directory.c_str());
+  if (isMade && !unpacked) ::rmdir(directory.c_str());
   return unpacked;
 }
 

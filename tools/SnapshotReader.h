@@ -3,23 +3,19 @@
 #include <cstdint>
 #include <filesystem>
 #include <map>
-#include <optional>
 #include <string>
-#include <variant>
 #include <vector>
+
+#include "platform/linux/base/Result.h"
 
 namespace halvox::tools {
 
-struct SnapshotReadError {
-  std::string description;  // names the file and the reason
-};
-
 // Returns the contents of the files in `names`, by name. A file that the snapshot lacks is absent
-// from the result. Blocks on the disk.
+// from the result. The message of a failure names the file and the reason. Blocks on the disk.
 //
 // A snapshot may come from an untrusted source. It is an error if it is larger than any that this
 // program writes, or if it holds anything but plain files and directories.
-[[nodiscard]] std::variant<std::map<std::string, std::string>, SnapshotReadError> readSnapshotFiles(
+[[nodiscard]] platform::linux_::Result<std::map<std::string, std::string>> readSnapshotFiles(
     const std::filesystem::path& snapshot, const std::vector<std::string>& names);
 
 enum class ExistingFiles : std::uint8_t { kRefuse, kReplace };
@@ -34,7 +30,7 @@ enum class ExistingFiles : std::uint8_t { kRefuse, kReplace };
 //
 // Changes the working directory of the process while it runs, so no other thread may use relative
 // paths.
-[[nodiscard]] std::variant<std::vector<std::string>, SnapshotReadError> unpackSnapshot(
+[[nodiscard]] platform::linux_::Result<std::vector<std::string>> unpackSnapshot(
     const std::filesystem::path& snapshot, const std::filesystem::path& directory,
     ExistingFiles existing);
 

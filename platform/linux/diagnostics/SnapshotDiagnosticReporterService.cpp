@@ -179,7 +179,7 @@ void SnapshotDiagnosticReporterService::Worker::carryOut(const Work& work) {
 }
 
 Outcome SnapshotDiagnosticReporterService::Worker::capture(const SnapshotRequest& request) {
-  if (const auto failure = directory_.prepare()) return {.failure = failure->why};
+  if (auto made = directory_.prepare(); !made) return {.failure = std::move(made).error().message};
   SnapshotSources sources{.paths = options_.paths,
                           .log = partners_.log,
                           .state = {},
@@ -197,11 +197,9 @@ Outcome SnapshotDiagnosticReporterService::Worker::capture(const SnapshotRequest
   if (auto failure = archive.finish()) return {.failure = std::move(*failure)};
   auto published = directory_.publish(request.time, textOf(request.signature, signature_key::kType),
                                       textOf(request.signature, signature_key::kSubType));
-  if (auto* failure = std::get_if<SnapshotDirectory::Failure>(&published)) {
-    return {.failure = std::move(failure->why)};
-  }
+  if (!published) return {.failure = std::move(published).error().message};
   archive.keep();
-  return {.path = std::get<std::filesystem::path>(std::move(published)), .size = archive.size()};
+  return {.path = *std::move(published), .size = archive.size()};
 }
 
 Dictionary SnapshotDiagnosticReporterService::Worker::conclude(const SnapshotRequest& request,

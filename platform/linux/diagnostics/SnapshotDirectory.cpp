@@ -103,13 +103,13 @@ std::string namePart(std::string_view text) {
 
 fs::path SnapshotDirectory::temporaryPath() const { return path_ / kTemporaryName; }
 
-std::optional<SnapshotDirectory::Failure> SnapshotDirectory::prepare() const {
-  if (::mkdir(path_.c_str(), 0700) == 0 || errno == EEXIST) return std::nullopt;
-  return Failure{path_.native() + ": " + errnoText(errno)};
+Result<void> SnapshotDirectory::prepare() const {
+  if (::mkdir(path_.c_str(), 0700) == 0 || errno == EEXIST) return {};
+  return Failure<>{path_.native() + ": " + errnoText(errno)};
 }
 
-std::variant<fs::path, SnapshotDirectory::Failure> SnapshotDirectory::publish(
-    Date time, std::string_view type, std::string_view subType) const {
+Result<fs::path> SnapshotDirectory::publish(Date time, std::string_view type,
+                                            std::string_view subType) const {
   const std::string stamp = stampOf(time);
   const std::string rest = "-" + namePart(type) + "-" + namePart(subType) + std::string(kSuffix);
   // Number snapshots of the same second upwards. The name of a deleted snapshot must not be used
@@ -131,7 +131,7 @@ std::variant<fs::path, SnapshotDirectory::Failure> SnapshotDirectory::publish(
     syncDirectory(path_);
     return to;
   }
-  return Failure{path_.native() + ": " + errnoText(error)};
+  return Failure<>{path_.native() + ": " + errnoText(error)};
 }
 
 std::vector<fs::path> SnapshotDirectory::newestFirst() const {

@@ -2,12 +2,11 @@
 
 #include <cstddef>
 #include <filesystem>
-#include <optional>
 #include <string>
 #include <string_view>
-#include <variant>
 #include <vector>
 
+#include "platform/linux/base/Result.h"
 #include "platform/value.h"
 
 namespace halvox::platform::linux_ {
@@ -17,10 +16,6 @@ namespace halvox::platform::linux_ {
 // time; any thread may call. All functions but path() and temporaryPath() block on the disk.
 class SnapshotDirectory {
  public:
-  struct Failure {
-    std::string why;
-  };
-
   explicit SnapshotDirectory(const std::filesystem::path& storageDirectory)
       : path_(storageDirectory / "snapshots") {}
 
@@ -28,12 +23,12 @@ class SnapshotDirectory {
   // The path of a snapshot while it is being written. There is only one at a time.
   [[nodiscard]] std::filesystem::path temporaryPath() const;
   // Creates the directory unless it exists, but not its parents.
-  [[nodiscard]] std::optional<Failure> prepare() const;
+  [[nodiscard]] Result<void> prepare() const;
   // Renames the file at temporaryPath() to its final name and returns the new path:
   // "<UTC time>-<type>-<sub-type>.tar.zst", with a number after the time if the second already has
   // snapshots. Never replaces a file.
-  [[nodiscard]] std::variant<std::filesystem::path, Failure> publish(
-      Date time, std::string_view type, std::string_view subType) const;
+  [[nodiscard]] Result<std::filesystem::path> publish(Date time, std::string_view type,
+                                                      std::string_view subType) const;
   // Deletes all snapshots except the newest `count`. Never deletes `justWritten`, which looks old
   // after the clock was set back. Files with other names are not touched.
   void keepNewest(std::size_t count, const std::filesystem::path& justWritten) const;

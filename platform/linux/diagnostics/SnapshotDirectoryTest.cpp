@@ -9,14 +9,13 @@ using ::testing::ElementsAre;
 
 class SnapshotDirectoryTest : public ::testing::Test {
  protected:
-  SnapshotDirectoryTest() { EXPECT_FALSE(directory.prepare().has_value()); }
+  SnapshotDirectoryTest() { EXPECT_TRUE(directory.prepare()); }
 
   std::string publish(double time, const std::string& type = "haptics",
                       const std::string& subType = "Generic") {
     writeText(directory.temporaryPath(), "x");
     const auto published = directory.publish(Date{time}, type, subType);
-    const auto* path = std::get_if<std::filesystem::path>(&published);
-    return path == nullptr ? "" : path->filename().string();
+    return published ? published->filename().string() : "";
   }
   std::vector<std::string> newestFirst() const {
     std::vector<std::string> names;

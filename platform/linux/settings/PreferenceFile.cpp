@@ -16,26 +16,25 @@ namespace {
 
 constexpr std::size_t kLongestReason = 400;
 
-PreferenceFileError problem(const std::filesystem::path& file, std::string_view what) {
-  PreferenceFileError error;
-  appendEscaped(error.description, file.native(), std::numeric_limits<std::size_t>::max());
-  appendEscaped(error.description, what, kLongestReason);
+Failure<> problem(const std::filesystem::path& file, std::string_view what) {
+  Failure<> error;
+  appendEscaped(error.message, file.native(), std::numeric_limits<std::size_t>::max());
+  appendEscaped(error.message, what, kLongestReason);
   return error;
 }
 
-PreferenceFileError problem(const std::filesystem::path& file, int error) {
+Failure<> problem(const std::filesystem::path& file, int error) {
   return problem(file, ": cannot read the preferences: " + errnoText(error));
 }
 
 // `size` may be less than the limit: the file grew after that was found.
-PreferenceFileError tooLarge(const std::filesystem::path& file, std::uint64_t size) {
+Failure<> tooLarge(const std::filesystem::path& file, std::uint64_t size) {
   return problem(file,
                  ": expected at most " + std::to_string(kLargestPreferenceFile) + " bytes, found " +
                      (size <= kLargestPreferenceFile ? std::string("more") : std::to_string(size)));
 }
 
-std::variant<std::optional<PreferenceText>, PreferenceFileError> readText(
-    const std::filesystem::path& file) {
+Result<std::optional<PreferenceText>> readText(const std::filesystem::path& file) {
   FileContent content = readWholeFile({.path = file.c_str(), .most = kLargestPreferenceFile});
   switch (content.outcome) {
     case FileContent::Outcome::kRead:
@@ -61,19 +60,16 @@ std::optional<std::filesystem::path> preferencePath(const std::filesystem::path&
   return directory / user / (std::string(domain) + ".toml");
 }
 
-std::variant<std::optional<PreferenceText>, PreferenceFileError> readPreferenceText(
-    const std::filesystem::path& file) {
+Result<std::optional<PreferenceText>> readPreferenceText(const std::filesystem::path& file) {
   auto content = readText(file);
-  const auto* text = std::get_if<std::optional<PreferenceText>>(&content);
-  if (text != nullptr && text->has_value() && isNestedTooDeep((*text)->text)) {
+  if (content && content->has_value() && isNestedTooDeep((*content)->text)) {
     return problem(file, ": expected at most " + std::to_string(kDeepestNesting) +
                              " levels of tables and arrays, found more");
   }
   return content;
 }
 
-std::variant<Dictionary, PreferenceFileError> parsePreferences(std::string_view text,
-                                                               const std::filesystem::path& file) {
+Result<Dictionary> parsePreferences(std::string_view text, const std::filesystem::path& file) {
   const toml::parse_result parsed = toml::parse(text);
   if (parsed) return toDictionary(parsed.table());
   const toml::parse_error& error = parsed.error();
@@ -82,10 +78,10 @@ std::variant<Dictionary, PreferenceFileError> parsePreferences(std::string_view 
                            ": expected TOML, found a mistake: " + std::string(error.description()));
 }
 
-std::variant<Dictionary, PreferenceFileError> readPreferences(const std::filesystem::path& file) {
+Result<Dictionary> readPreferences(const std::filesystem::path& file) {
   auto content = readPreferenceText(file);
-  if (auto* error = std::get_if<PreferenceFileError>(&content)) return std::move(*error);
-  const auto& text = std::get<std::optional<PreferenceText>>(content);
+  if (!content) return std::move(content).error();
+  const std::optional<PreferenceText>& text = *content;
   if (!text.has_value()) return Dictionary();
   return parsePreferences(text->text, file);
 }

@@ -5,25 +5,20 @@
 #include <optional>
 #include <string>
 #include <string_view>
-#include <variant>
 
+#include "platform/linux/base/Result.h"
 #include "platform/value.h"
 
 namespace halvox::platform::linux_ {
 
 // Preference files: one TOML file for each user and domain. These functions block on the disk, and
-// any thread may call them.
+// any thread may call them. The message of a failure is one line for the user. It begins with the
+// file name, or with "FILE:LINE:COLUMN: " for a mistake in the file.
 
 // The user whose files hold the named suites and the watched settings.
 inline constexpr std::string_view kPreferenceUser = "mobile";
 // Larger files are refused: callers on the service's queues wait for the reading.
 inline constexpr std::size_t kLargestPreferenceFile = 1U << 20U;
-
-// Why a file cannot be read or changed: one line for the user that begins with the file name, or
-// with "FILE:LINE:COLUMN: " for a mistake in the file.
-struct PreferenceFileError {
-  std::string description;
-};
 
 // The content and the permissions of a file.
 struct PreferenceText {
@@ -37,14 +32,12 @@ std::optional<std::filesystem::path> preferencePath(const std::filesystem::path&
 
 // Returns the text of a file; std::nullopt when there is no such file. Accepts only regular files
 // within the limits of size and nesting, and never waits for another process.
-std::variant<std::optional<PreferenceText>, PreferenceFileError> readPreferenceText(
-    const std::filesystem::path& file);
+Result<std::optional<PreferenceText>> readPreferenceText(const std::filesystem::path& file);
 
 // Returns the values in a text. `file` is only for the error message.
-std::variant<Dictionary, PreferenceFileError> parsePreferences(std::string_view text,
-                                                               const std::filesystem::path& file);
+Result<Dictionary> parsePreferences(std::string_view text, const std::filesystem::path& file);
 
 // Returns the values in a file; empty when there is no such file.
-std::variant<Dictionary, PreferenceFileError> readPreferences(const std::filesystem::path& file);
+Result<Dictionary> readPreferences(const std::filesystem::path& file);
 
 }  // namespace halvox::platform::linux_

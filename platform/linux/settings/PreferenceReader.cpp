@@ -35,13 +35,14 @@ std::optional<Dictionary> PreferenceReader::read(std::string_view user,
     return std::nullopt;
   }
   auto content = readPreferences(*file);
-  if (const auto* error = std::get_if<PreferenceFileError>(&content)) {
-    logOnce(file->native(), error->description + stateOf(*file),
-            error->description + "; until it is fixed, its values count as absent");
+  if (!content) {
+    const std::string& message = content.error().message;
+    logOnce(file->native(), message + stateOf(*file),
+            message + "; until it is fixed, its values count as absent");
     return std::nullopt;
   }
   logFixed(file->native());
-  return std::get<Dictionary>(std::move(content));
+  return *std::move(content);
 }
 
 void PreferenceReader::logOnce(const std::string& subject, const std::string& state,
