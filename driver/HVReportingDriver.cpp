@@ -18,6 +18,7 @@ HVReportingDriver HVReportingDriver::driverWithGroupName(
 }
 
 std::string HVReportingDriver::description() const {
+  // The "(null)" is part of the interface: snapshots are keyed by this text.
   return groupName_.value_or("(null)") + "-" + subGroupName_.value_or("(null)");
 }
 

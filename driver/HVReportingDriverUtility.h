@@ -54,6 +54,7 @@ class HVReportingDriverUtility {
                                        std::string_view type);
 
  private:
+  // The messages of one report, by format.
   struct Stats {
     DriverStats simple;
     DriverStats histogram;

@@ -98,6 +98,7 @@ int show(const ChannelDescription& channel, Numbers values,
 // The values of each channel. By address, which is a channel's identity.
 using ValuesByChannel = std::unordered_map<const ChannelDescription*, Numbers>;
 
+// One look-up for each channel of the current samples, whatever the order of the previous ones.
 ValuesByChannel index(const DriverSamples& samples) {
   ValuesByChannel values;
   for (const auto& [reading, selection] : samples.parts()) {

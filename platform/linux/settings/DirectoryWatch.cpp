@@ -9,11 +9,13 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The watched directory itself is moved or deleted.
+// The watched directory itself was moved or deleted.
 constexpr std::uint32_t kLeaving = IN_MOVE_SELF | IN_DELETE_SELF;
 constexpr std::uint32_t kAppearing = IN_CREATE | IN_MOVED_TO;
 constexpr std::uint32_t kVanishing = IN_MOVED_FROM | IN_DELETE;
+// Close after writing instead of each write: a save is one change. IN_ATTRIB notices `touch`.
 constexpr std::uint32_t kChanging = IN_CLOSE_WRITE | IN_ATTRIB | kAppearing | kVanishing;
+// After one of these the watches may be incomplete, and all are made again.
 constexpr std::uint32_t kGone = kLeaving | IN_IGNORED | IN_UNMOUNT | IN_Q_OVERFLOW;
 
 bool isMissing(std::error_code error) {
@@ -37,6 +39,7 @@ std::error_code DirectoryWatch::arm(std::vector<std::filesystem::path> directori
   directories_ = normal(std::move(directories));
   watches_.clear();
   isThere_.assign(directories_.size(), false);
+  // A new instance instead of removing watches one by one: events of the old watches go with it.
   inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (!inotify_) return lastError();
   std::error_code first;

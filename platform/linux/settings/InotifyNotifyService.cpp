@@ -28,6 +28,7 @@ constexpr UnitLog kLog(settingsCategory, "InotifyNotifyService");
 // first: steady changes must not delay a post for ever.
 constexpr auto kQuietTime = 50ms;
 constexpr auto kLongestDelay = 300ms;
+// Only while watching fails, so that it wakes nobody otherwise.
 constexpr auto kRetryTime = 5s;
 
 // The directories that are always watched, in order.
@@ -36,7 +37,7 @@ constexpr std::size_t kPreferenceDirectory = 1;
 constexpr std::size_t kFirstLinked = 2;
 
 int pollTimeout(std::optional<std::chrono::steady_clock::time_point> until) {
-  if (!until.has_value()) return -1;
+  if (!until.has_value()) return -1;  // sleep until something happens
   const auto left =
       std::chrono::ceil<std::chrono::milliseconds>(*until - std::chrono::steady_clock::now());
   return static_cast<int>(std::max<std::int64_t>(left.count(), 0));

@@ -9,7 +9,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// The kernel follows no more (path_resolution(7)).
+// The kernel follows at most this many links (path_resolution(7)).
 constexpr std::size_t kMostLinks = 40;
 
 }  // namespace

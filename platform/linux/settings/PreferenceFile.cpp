@@ -14,6 +14,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
+// The parser quotes the file in its reasons, and anyone may write the file.
 constexpr std::size_t kLongestReason = 400;
 
 Failure<> problem(const std::filesystem::path& file, std::string_view what) {

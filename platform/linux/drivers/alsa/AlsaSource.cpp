@@ -36,6 +36,7 @@ std::vector<std::string> namesIn(int directory) {
     if (found->d_name[0] != '.') names.emplace_back(found->d_name);
     if (names.size() == kMostEntries) break;
   }
+  // A directory has no order of its own, and later cards and devices of one name get a number.
   std::ranges::sort(names);
   return names;
 }

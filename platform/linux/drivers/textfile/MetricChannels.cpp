@@ -10,6 +10,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
+// Bounds for what one file can make a report contain; real state sets and histograms are far
+// smaller.
 constexpr std::size_t kMostStates = 64;
 constexpr std::size_t kMostBuckets = 256;
 
@@ -163,6 +165,7 @@ class ChannelMaker {
   void addStateChannel(const MetricFamily& family, const MetricLabels& labels,
                        const std::vector<const MetricSample*>& samples);
   std::uint64_t stateCount(const MetricFamily& counter, const MetricSample& state);
+  // Two channels of one name would have one key in a report, and one of them would be lost.
   void refuseDoubles() const;
 
   const OpenMetricsText::Families& families_;

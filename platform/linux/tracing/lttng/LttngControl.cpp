@@ -105,6 +105,7 @@ LttngControl::LttngControl(std::filesystem::path tracesDirectory)
       daemon_(tracesDirectory_ / "lttng-sessiond") {}
 
 std::string LttngControl::namePrefix() const {
+  // Device and inode identify the directory itself; one directory can have several paths.
   struct stat status {};
   ::stat(tracesDirectory_.c_str(), &status);
   return "halvox-" + std::to_string(status.st_dev) + "-" + std::to_string(status.st_ino) + "-";

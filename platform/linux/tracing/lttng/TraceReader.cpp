@@ -179,6 +179,7 @@ class TraceGraph {
  public:
   // True if the graph can run. Otherwise the library has an error.
   [[nodiscard]] bool build(const std::vector<std::string>& directories, Sink& sink) {
+    // The plugins are looked up by name at run time; a machine may lack them.
     graph_.reset(bt_graph_create(0));
     if (!graph_ || !find("ctf", ctf_) || !find("utils", utils_)) return false;
     const auto* const filter =
