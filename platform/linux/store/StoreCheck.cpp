@@ -91,8 +91,9 @@ std::optional<std::string> StoreCheck::finding() {
 void StoreCheck::run(const std::string& file, const StoreExtent& extent, const OnDamage& onDamage) {
   setUpThread("halvox-check");
   giveWayToOthers();
-  kLog.info("checking ", file,
-            " in the background because the last run did not close it, or not check it to the end");
+  kLog.info(
+      "checking ", file,
+      " in the background because the last run did not close it or did not finish checking it");
   Database database;
   std::string what;
   Outcome outcome = Outcome::kUnreadable;
