@@ -20,15 +20,16 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::size_t kLargestFile = 1U << 20U;
+// Less than PATH_MAX, with room for the names of files below the path.
 constexpr std::size_t kLongestPath = 4000;
 constexpr std::size_t kLongestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
-constexpr std::size_t kLongestStreamName = 255;  // it becomes the name of a directory
+constexpr std::size_t kLongestStreamName = 255;  // the server uses it as the name of a directory
 constexpr NumberRange kDays{1, 36'500};
 constexpr NumberRange kMegabytes{1, 1U << 20U};
-constexpr NumberRange kReplicas{1, 5};  // what JetStream takes
+constexpr NumberRange kReplicas{1, 5};  // what JetStream accepts
 constexpr NumberRange kSessions{1, 1'000'000'000};
-// One message to 10,000 sessions holds the others up for some hundredths of a second, one to the
-// greatest number for seconds.
+// A message to 10,000 sessions delays all other requests for some hundredths of a second, one to
+// 1,000,000 for seconds.
 constexpr NumberRange kReporterIDs{1, 1'000'000};
 constexpr NumberRange kSnapshots{1, 10'000};
 
@@ -75,22 +76,22 @@ std::variant<std::optional<std::string>, ConfigurationError> readText(
 
 bool isNotEmpty(std::string_view text) { return !text.empty(); }
 
-// Three octal digits after a zero, with which the owner may connect.
+// Three octal digits after a zero, of which the first lets the owner connect.
 bool isMode(std::string_view text) {
   return text.size() == 4 && text[0] == '0' && (text[1] == '6' || text[1] == '7') &&
          std::ranges::all_of(text, [](char digit) { return digit >= '0' && digit <= '7'; });
 }
 
-// Who may connect when the file does not say: the members of a group that it names; nobody else
-// when the socket is among the files of a login; every user to a service of the system, because
-// every user's programs report.
+// The mode without a setting. With a group, its members may connect. A socket in the runtime
+// directory of a login is for that user. A service of the system is for every user, because the
+// programs of every user report.
 std::uint32_t defaultMode(const Configuration::Listener& listener) {
   constexpr std::uint32_t kUser = 0600;
   constexpr std::uint32_t kGroup = 0660;
-  constexpr std::uint32_t kEverybody = 0666;
   if (!listener.group.empty()) return kGroup;
   const auto login = environmentPath("XDG_RUNTIME_DIR");
-  return login.has_value() && isBelow(listener.socket, *login) ? kUser : kEverybody;
+  return login.has_value() && isBelow(listener.socket, *login) ? kUser
+                                                               : defaults::kSocketModeOfSystem;
 }
 
 void readMode(TableReader& table, Configuration::Listener& listener) {
@@ -130,12 +131,13 @@ void readStorage(TableReader table, Configuration::Storage& storage) {
 void readAnalytics(TableReader table, Configuration::Analytics& analytics) {
   std::size_t sink = 0;
   table.read("wanted", analytics.wanted);
-  // Another sink must not be taken for this one in silence: the events would go the wrong way.
+  // Read although there is one choice: a file that asks for another sink must not start a service
+  // that sends events elsewhere.
   table.readChoice("sink", {"sqlite"}, sink);
   table.finish();
 }
 
-// Printable ASCII without blanks, as the names and addresses of the protocol have it.
+// Printable ASCII without blanks: the NATS protocol separates names by blanks.
 bool isGraphic(std::string_view text) {
   return !text.empty() && std::ranges::all_of(text, [](char character) {
     return character > ' ' && character <= '~';
@@ -149,7 +151,7 @@ bool isServerURL(std::string_view text) {
   return false;
 }
 
-// Names between single dots.
+// Names separated by single dots. "$" begins the subjects of the server itself.
 bool isSubject(std::string_view text) {
   return isGraphic(text) && text.find_first_of("*>") == std::string_view::npos &&
          text.find("..") == std::string_view::npos && !text.starts_with('.') &&
@@ -163,13 +165,13 @@ bool isStreamName(std::string_view text) {
 
 void readLinkTls(TableReader table, std::optional<Configuration::Link::Tls>& result) {
   if (!table.isPresent()) return;
-  // Not emplace(), which clang 14 finds no constructor for.
+  // Not emplace(): clang 14 finds no constructor for an aggregate.
   Configuration::Link::Tls& tls = *(result = Configuration::Link::Tls{});
   table.read("ca", tls.ca, kLongestPath);
   table.read("certificate", tls.certificate, kLongestPath);
   table.read("key", tls.key, kLongestPath);
   table.read("verify", tls.verify);
-  // One of the two alone would be left out in silence, and the servers would refuse us.
+  // The link needs both: it would ignore a key alone, and the servers would then refuse it.
   if (tls.key.empty()) table.refuse("certificate", "a path together with link.tls.key");
   if (tls.certificate.empty()) table.refuse("key", "a path together with link.tls.certificate");
   table.finish();
@@ -225,7 +227,7 @@ void readDirectory(TableReader table, std::filesystem::path& directory) {
   table.finish();
 }
 
-// What is below the storage directory unless it is put elsewhere.
+// Directories that are in the storage directory unless the file says otherwise.
 void setDefaultDirectories(Configuration& configuration) {
   configuration.preferencesDirectory = configuration.storage.directory / "preferences";
   configuration.notifyDirectory = configuration.storage.directory / "notify";
@@ -312,7 +314,7 @@ std::variant<Configuration, ConfigurationError> loadConfiguration(const DefaultP
 }
 
 std::variant<std::filesystem::path, ConfigurationError> configuredSocket() {
-  // Without a socket of its own, so that one in the result is one that was named.
+  // Without a default socket: a socket in the result is then one that the file names.
   auto loaded = loadConfiguration({.socket = {}, .storageDirectory = defaultStorageDirectory()});
   if (auto* configuration = std::get_if<Configuration>(&loaded)) {
     return std::move(configuration->listener.socket);

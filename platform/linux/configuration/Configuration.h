@@ -10,6 +10,7 @@
 #include <variant>
 #include <vector>
 
+#include "platform/linux/configuration/Defaults.h"
 #include "platform/log.h"
 #include "platform/value.h"
 
@@ -22,52 +23,54 @@ enum class LinkBackend : std::uint8_t { kLocal, kNats, kNone };
 using FeatureSwitches =
     std::map<std::string, std::map<std::string, bool, std::less<>>, std::less<>>;
 
-// All that the configuration file can say, with the defaults for what it does not.
-// Plain data: read once at start, then only read.
+// The settings of the configuration file, with defaults for absent ones. Units are in the names or
+// in Defaults.h; docs/configuration.md describes each key. Plain data: filled once at the start,
+// then only read, by any thread.
 struct Configuration {
   struct Listener {
     std::filesystem::path socket;
     std::uint32_t mode = 0;  // permission bits of the socket's file
-    std::string group;       // whom the file is given to; empty: as it is made
+    std::string group;       // owns the socket's file; empty: unchanged
     BusKind bus = BusKind::kNone;
-    std::chrono::milliseconds handshakeTimeout{30'000};  // handshake_seconds
-    std::chrono::milliseconds messageTimeout{60'000};  // message_seconds: a message begun must end
+    std::chrono::milliseconds handshakeTimeout{defaults::kHandshakeTimeout};  // handshake_seconds
+    std::chrono::milliseconds messageTimeout{defaults::kMessageTimeout};      // message_seconds
   };
   struct Storage {
     std::filesystem::path directory;
     std::filesystem::path root;
-    std::uint32_t retentionDays = 30;
-    std::uint32_t maxMegabytes = 512;
+    std::uint32_t retentionDays = defaults::kRetentionDays;
+    std::uint32_t maxMegabytes = defaults::kStorageMegabytes;
   };
   struct Analytics {
-    std::vector<std::string> wanted{"*"};  // glob patterns of event names
+    std::vector<std::string> wanted{defaults::kWantedEvents};  // glob patterns of event names
   };
   struct Link {
-    // [link.tls]: a path that is empty was not given; the files are not looked at here.
+    // [link.tls]. An empty path means that the key is absent. The files are read when the link
+    // connects, not here.
     struct Tls {
-      std::filesystem::path ca;           // who signs for the servers; empty: the system's list
-      std::filesystem::path certificate;  // our own, always together with `key`
+      std::filesystem::path ca;           // trusted authorities; empty: the system's
+      std::filesystem::path certificate;  // the service's own; always together with `key`
       std::filesystem::path key;
       bool verify = true;  // whether the servers' certificates are checked
     };
     LinkBackend backend = LinkBackend::kLocal;
     std::vector<std::string> servers{"nats://127.0.0.1:4222"};  // at least one
-    std::string subject = "halvox";                             // what all subjects begin with
+    std::string subject = "halvox";                             // first part of all subjects
     std::string stream = "HALVOX";
-    std::uint64_t replicas = 1;         // of the stream, when the service makes it
-    std::optional<Tls> tls;             // none: as the servers' URLs say
-    std::filesystem::path credentials;  // a NATS credentials file; empty: none
+    std::uint64_t replicas = defaults::kStreamReplicas;  // of a stream that the service creates
+    std::optional<Tls> tls;                              // none: TLS if a server's URL asks for it
+    std::filesystem::path credentials;                   // a NATS credentials file; empty: none
   };
   struct Drivers {
     bool alsa = true;
-    std::filesystem::path alsaRoot = "/";  // /proc/asound and /sys/class/sound are below it
+    std::filesystem::path alsaRoot = "/";  // contains proc/asound and sys/class/sound
     bool pipewire = true;
     std::filesystem::path textfiles;  // directory of *.prom files
   };
   struct Limits {
-    std::uint64_t clientHistoryMegabytes = 256;
-    std::uint64_t clientSessions = 100'000;
-    std::uint64_t messageReporterIDs = 10'000;  // message_reporter_ids
+    std::uint64_t clientHistoryMegabytes = defaults::kClientHistoryMegabytes;
+    std::uint64_t clientSessions = defaults::kClientSessions;
+    std::uint64_t messageReporterIDs = defaults::kMessageReporterIDs;  // message_reporter_ids
   };
 
   Listener listener;
@@ -79,19 +82,20 @@ struct Configuration {
   std::filesystem::path preferencesDirectory;  // [preferences]: <directory>/<user>/<domain>.toml
   std::filesystem::path notifyDirectory;       // [notify]: files that post by their names
   LogLevel logLevel = LogLevel::kDefault;
-  // The least level of the lines that stay in memory for captures of diagnostics.
+  // The least level of the lines that the log keeps in memory for captures of diagnostics.
   LogLevel logMemoryLevel = LogLevel::kInfo;
-  std::uint32_t keepSnapshots = 20;
+  std::uint32_t keepSnapshots = defaults::kKeptSnapshots;
   Dictionary device;         // [device]: property to value
   FeatureSwitches features;  // [features.Domain]: name to switch
 };
 
-// Why a configuration was not taken. `description` is one line for the user: for a wrong file
-// "FILE:LINE:COLUMN: KEY: expected X, found Y", for an unreadable one the file and the reason.
+// Why a configuration cannot be used. `description` is one line for the user: for a file with a
+// mistake "FILE:LINE:COLUMN: KEY: expected X, found Y", for an unreadable file its name and the
+// reason.
 struct ConfigurationError {
   enum class Kind : std::uint8_t {
-    kWrong,       // the file's content: exit status 78
-    kUnreadable,  // there is no reading it: exit status 66
+    kWrong,       // a mistake in the file: exit status 78
+    kUnreadable,  // the file cannot be read: exit status 66
   };
   Kind kind = Kind::kWrong;
   std::string description;
@@ -101,27 +105,28 @@ struct ConfigurationError {
 // (~/.config when unset), else /etc/halvox/halvox.toml.
 std::filesystem::path configurationPath();
 
-// Where things are of which the file says nothing.
+// The places that are used when the file does not name them.
 struct DefaultPlaces {
   std::filesystem::path socket;
   std::filesystem::path storageDirectory;
 };
 
-// Where a service puts them, by its environment: $RUNTIME_DIRECTORY, $STATE_DIRECTORY, $XDG_...
+// The default places of a service, from its environment: $RUNTIME_DIRECTORY, $STATE_DIRECTORY, else
+// $XDG_RUNTIME_DIR and $XDG_STATE_HOME.
 DefaultPlaces placesOfService();
 
-// The configuration of an absent file: all defaults.
+// The configuration without a file: all defaults.
 Configuration defaultConfiguration(const DefaultPlaces& places = placesOfService());
 
-// Reads the configuration from the file that the environment names. A missing file means all
-// defaults, but a file that $HALVOX_CONFIG names must exist. Of several mistakes the first in the
-// file is told.
+// Reads the file of configurationPath(). Without a file all settings have their defaults, but a
+// file that $HALVOX_CONFIG names must exist. Of several mistakes, the first in the file is
+// returned.
 std::variant<Configuration, ConfigurationError> loadConfiguration(
     const DefaultPlaces& places = placesOfService());
 
-// The socket that the configuration names, for programs that look for the service; empty when it
-// names none, and when the file is one that nobody named and that this user may not read, as the
-// system's may be.
+// Returns the socket that the configuration names, for programs that look for the service; empty if
+// it names none. Also empty if this user may not read the file and $HALVOX_CONFIG does not name it:
+// the system's file may be readable to the service alone.
 std::variant<std::filesystem::path, ConfigurationError> configuredSocket();
 
 }  // namespace halvox::platform::linux_

@@ -11,6 +11,7 @@
 
 #include "platform/connection.h"
 #include "platform/linux/configuration/Configuration.h"
+#include "platform/linux/configuration/Defaults.h"
 #include "platform/linux/connection/BusAddress.h"
 #include "platform/linux/connection/ConnectionLimits.h"
 #include "platform/linux/dispatch/Backpressure.h"
@@ -25,8 +26,8 @@ enum class EndSignals : std::uint8_t { kHandle, kLeaveAlone };
 
 // Who may connect to the socket's file.
 struct SocketAccess {
-  std::uint32_t mode = 0666;  // permission bits
-  std::string group;          // the file is given to this group; empty: left as it is made
+  std::uint32_t mode = defaults::kSocketModeOfSystem;  // permission bits
+  std::string group;  // the file is given to this group; empty: left as it is made
 };
 
 // How connections are served.
@@ -41,11 +42,11 @@ struct ConnectionOptions {
   // bus starts has this in its environment, and so have the programs that are started from there.
   std::optional<StarterBus> starter;
   std::string busName = "com.tarno.halvox.reporting";
-  std::chrono::milliseconds handshakeTimeout{30'000};
-  std::chrono::milliseconds messageTimeout{60'000};
-  std::uint64_t clientHistoryMegabytes = 256;  // 2^20 bytes each
-  std::uint64_t clientSessions = 100'000;
-  std::uint64_t messageReporterIDs = 10'000;  // named by one request
+  std::chrono::milliseconds handshakeTimeout{defaults::kHandshakeTimeout};
+  std::chrono::milliseconds messageTimeout{defaults::kMessageTimeout};
+  std::uint64_t clientHistoryMegabytes = defaults::kClientHistoryMegabytes;  // 2^20 bytes each
+  std::uint64_t clientSessions = defaults::kClientSessions;
+  std::uint64_t messageReporterIDs = defaults::kMessageReporterIDs;  // named by one request
   std::size_t maxFrameBytes = 32 * kMiB;
   EndSignals signals = EndSignals::kHandle;
   // Called on the I/O thread before the first delivery of a turn, after the last one, and once the

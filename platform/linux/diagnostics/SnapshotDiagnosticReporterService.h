@@ -7,6 +7,7 @@
 #include <memory>
 
 #include "platform/diagnostic_reporter.h"
+#include "platform/linux/configuration/Defaults.h"
 #include "platform/linux/diagnostics/SnapshotRecorder.h"
 #include "platform/linux/diagnostics/SystemFacts.h"
 #include "platform/linux/log/LogMemory.h"
@@ -16,8 +17,8 @@ namespace halvox::platform::linux_ {
 
 struct SnapshotOptions {
   std::filesystem::path storageDirectory;
-  std::uint32_t keep = 20;               // the number of newest snapshots to keep
-  std::uint64_t mostBytes = 64U << 20U;  // the size of one, before compression
+  std::uint32_t keep = defaults::kKeptSnapshots;  // the number of newest snapshots to keep
+  std::uint64_t mostBytes = 64U << 20U;           // the size of one, before compression
   // When this time is over, what was collected is written.
   std::chrono::milliseconds collectWithin{8000};
   std::chrono::milliseconds stateWithin{2000};  // for the service's state

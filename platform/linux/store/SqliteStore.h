@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "platform/clock.h"
+#include "platform/linux/configuration/Defaults.h"
 #include "platform/linux/dispatch/Backpressure.h"
 #include "platform/linux/store/AnalyticsRecords.h"
 #include "platform/linux/store/EventNames.h"
@@ -28,9 +29,9 @@ namespace halvox::platform::linux_ {
 
 struct StoreOptions {
   std::filesystem::path directory;
-  std::uint32_t retentionDays = 30;
-  std::uint32_t maxMegabytes = 512;            // database and write-ahead log together
-  std::vector<std::string> wantedEvents{"*"};  // patterns of event names, for fnmatch(3)
+  std::uint32_t retentionDays = defaults::kRetentionDays;
+  std::uint32_t maxMegabytes = defaults::kStorageMegabytes;        // database and log together
+  std::vector<std::string> wantedEvents{defaults::kWantedEvents};  // patterns for fnmatch(3)
   QueueLimits queue{};
 };
 
