@@ -30,9 +30,9 @@ void CallbackThread::stop() {
   if (last.joinable()) last.join();
 }
 
-// False when the system has none to give.
+// Returns false if the system cannot start a thread.
 bool CallbackThread::provideThread() {
-  // The last one has given the lock back for good, so this takes no longer than its end.
+  // A thread from before has released the lock for the last time, so join() does not wait for it.
   if (thread_.joinable()) thread_.join();
   try {
     thread_ = std::thread(&CallbackThread::run, this);

@@ -9,12 +9,12 @@
 
 namespace halvox::platform::linux_ {
 
-// The thread on which a real-time framework without threads of its own calls its callbacks: one
-// after the other, in the order in which they were given. It is made when there is something to
-// call and ends when nothing is left, so that an idle service has none.
-//
-// Any thread may call. Does not own the dispatch service, which must be there whenever call() is:
-// where the system has no thread to give, its background queue calls.
+// Calls the callbacks of link back-ends that have no thread of their own, one after the other in
+// the order of call(). The thread starts with the first callback and ends when none is left: an
+// idle service has no such thread. If the system cannot start a thread, the background queue of
+// `dispatch` calls instead.
+// Threads: any may call. Owner: the platform, which also owns `dispatch`; `dispatch` must exist
+// during call().
 class CallbackThread {
  public:
   using Callback = std::function<void()>;
@@ -24,9 +24,9 @@ class CallbackThread {
   CallbackThread& operator=(const CallbackThread&) = delete;
   ~CallbackThread() { stop(); }
 
-  // Calls back later and never on the calling thread; drops the callback after stop().
+  // Calls `callback` later, never on the calling thread. Drops it after stop(). Never blocks.
   void call(Callback callback) HALVOX_EXCLUDES(mutex_);
-  // Waits until everything was called. May be called again; not from a callback.
+  // Waits until all callbacks have run. May be called again. Must not be called from a callback.
   void stop() HALVOX_EXCLUDES(mutex_);
 
  private:
@@ -36,7 +36,8 @@ class CallbackThread {
   DispatchService& dispatch_;
   Mutex mutex_;
   std::deque<Callback> waiting_ HALVOX_GUARDED_BY(mutex_);
-  bool isRunning_ HALVOX_GUARDED_BY(mutex_) = false;  // the thread looks again before it ends
+  bool isRunning_ HALVOX_GUARDED_BY(mutex_) =
+      false;  // the thread will see waiting_ again before it ends
   bool isStopped_ HALVOX_GUARDED_BY(mutex_) = false;
   std::thread thread_ HALVOX_GUARDED_BY(mutex_);
 };

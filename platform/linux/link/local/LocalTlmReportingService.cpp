@@ -13,9 +13,9 @@ constexpr const char* kErrorDomain = "com.tarno.halvox.link";
 constexpr std::int64_t kStoreClosed = 1;
 constexpr std::size_t kLongestName = 255;
 
-// A client's configuration can put any value in the place of a name. Names are stored with every
-// message, so what is too long for a name is cut off between characters: else small messages could
-// fill the store and keep it busy.
+// A client's configuration can give any value as a name, of any length, and names are stored with
+// every message. A name of 8 MiB would fill the store with a few small messages; names are
+// therefore cut, between characters.
 std::string nameOf(const Dictionary& info, std::string_view key) {
   const Value* const value = info.find(key);
   if (value == nullptr) return {};
@@ -34,7 +34,7 @@ std::shared_ptr<const LinkParty> partyOf(const Dictionary& sessionInfo,
 
 }  // namespace
 
-// What all messages of a session have in common. Immutable.
+// A session: what all its messages have in common. Immutable.
 class LocalTlmReportingService::LocalSession final : public TLMReportingSession {
  public:
   explicit LocalSession(std::shared_ptr<const LinkParty> party) : party_(std::move(party)) {}

@@ -10,17 +10,18 @@
 
 namespace halvox::platform::linux_ {
 
-// The real-time reporting framework of a machine on its own: every message becomes a record of the
-// store, under the time of the call, in the order of the calls. There is one back-end, called
-// "local", and it is always found.
+// The real-time reporting framework of a machine without servers: every message becomes a record of
+// the store, with the time of the call, in the order of the calls. There is one back-end, "local",
+// and every discovery finds it.
 //
-// A message that was sent is with the store's writer, which has it in the database within half a
-// second whoever ends its session meanwhile; so a flush is done at once. What the store then
-// cannot keep, it counts. Any thread may call; calls wait while the store has no room. Does not own
-// what it is made with, which must outlive it and its sessions.
+// The store's writer commits a message within half a second, even if its session has ended. A flush
+// therefore completes at once. The store counts the messages that it cannot write.
+// Threads: any may call; a call blocks while the store's queue is full.
+// Owner: the platform, which also owns the store, the clock and the callback thread. They must
+// outlive this object and its sessions.
 class LocalTlmReportingService final : public TLMReportingService {
  public:
-  // Answers discoveries on that thread.
+  // Discoveries are answered on the thread of `callbacks`.
   LocalTlmReportingService(SqliteStore& store, const ClockService& clock, CallbackThread& callbacks)
       : records_(store.linkMessages()), clock_(clock), callbacks_(callbacks) {}
 
@@ -28,7 +29,7 @@ class LocalTlmReportingService final : public TLMReportingService {
   Session TLMReportingCreateSession(const Dictionary& sessionInfo,
                                     const Dictionary& userInfo) override;
   void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) override;
-  // Fails only when the store is closed already.
+  // Fails only after the store was closed.
   TLMReportingOutcome TLMReportingSendMessage(const Session& session,
                                               const TLMReportingMessage& message) override;
   void TLMReportingFlushMessages(const Session& session, std::function<void()> flushed) override;
@@ -45,7 +46,7 @@ class LocalTlmReportingService final : public TLMReportingService {
   LinkMessageRecords& records_;
   const ClockService& clock_;
   CallbackThread& callbacks_;
-  std::atomic<std::uint64_t> lastToken_{0};  // orders with nothing: only unlike the others
+  std::atomic<std::uint64_t> lastToken_{0};  // orders nothing; only unique
 };
 
 }  // namespace halvox::platform::linux_

@@ -47,7 +47,9 @@ TLMReportingOutcome NoneTlmReportingService::TLMReportingSendOneMessage(
 TLMReportingOutcome NoneTlmReportingService::refuse() {
   received_.add();
   dropped_.add();
-  return {.sent = false, .error = Error{"com.tarno.halvox.link", 2, "there is no back-end"}};
+  return {
+      .sent = false,
+      .error = Error{"com.tarno.halvox.link", 2, "the link is disabled: link.backend is \"none\""}};
 }
 
 }  // namespace halvox::platform::linux_

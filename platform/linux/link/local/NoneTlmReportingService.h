@@ -9,12 +9,13 @@
 
 namespace halvox::platform::linux_ {
 
-// The real-time reporting framework where there is nobody to report to: no back-end is ever found,
-// and what is sent nevertheless is counted and refused. Any thread may call. Does not own what it
-// is made with, which must outlive it.
+// The real-time reporting framework of a service whose link is disabled: no discovery finds a
+// back-end, and every message is counted and refused.
+// Threads: any may call; nothing blocks. Owner: the platform, which also owns the objects of the
+// constructor; they must outlive this one.
 class NoneTlmReportingService final : public TLMReportingService {
  public:
-  // Answers discoveries on that thread.
+  // Discoveries are answered on the thread of `callbacks`.
   NoneTlmReportingService(StatisticsService& statistics, CallbackThread& callbacks)
       : callbacks_(callbacks),
         received_(statistics.counter("link none", "received")),
@@ -23,7 +24,7 @@ class NoneTlmReportingService final : public TLMReportingService {
   Token TLMHierarchyTokenCreate() override;
   Session TLMReportingCreateSession(const Dictionary& sessionInfo,
                                     const Dictionary& userInfo) override;
-  // Calls back with none.
+  // Calls `found` with nothing.
   void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) override;
   TLMReportingOutcome TLMReportingSendMessage(const Session& session,
                                               const TLMReportingMessage& message) override;
@@ -36,7 +37,7 @@ class NoneTlmReportingService final : public TLMReportingService {
   TLMReportingOutcome refuse();
 
   CallbackThread& callbacks_;
-  std::atomic<std::uint64_t> lastToken_{0};  // orders with nothing: only unlike the others
+  std::atomic<std::uint64_t> lastToken_{0};  // orders nothing; only unique
   Counter& received_;
   Counter& dropped_;
 };

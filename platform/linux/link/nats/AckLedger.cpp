@@ -33,7 +33,7 @@ void AckLedger::resolve(Number message, AckOutcome outcome) {
     const auto flush = std::ranges::find_if(flushes_, [message](const Account& account) {
       return message >= account.first && message <= account.last;
     });
-    if (flush == flushes_.end()) return;  // that flush was given up, and told so
+    if (flush == flushes_.end()) return;  // of a flush that was given up
     note(*flush, outcome);
     if (flush->outstanding > 0) return;
     ended = std::move(*flush);

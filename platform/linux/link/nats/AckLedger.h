@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// What became of the messages that one flush waited for.
+// The result of the messages that one flush waited for.
 struct AckTally {
   std::uint64_t acknowledged = 0;
   std::uint64_t notAcknowledged = 0;
@@ -18,27 +18,30 @@ struct AckTally {
 enum class AckOutcome : std::uint8_t {
   kAcknowledged,
   kFailed,
-  kRefused,  // its sender was told: no flush counts it
+  kRefused,  // the sender got an error instead; no flush counts it
 };
 
-// The bookkeeping of one session: which of its messages a server has confirmed, and who waits for
-// that. A flush waits for the messages that were added before it and since the flush before, never
-// for later ones, and tells what became of exactly these.
-// Any thread; shared by the session and by its messages on their way. Never blocks.
+// Accounts for the acknowledgements of one session, on which its flushes wait. A flush waits for
+// the messages added since the previous flush, never for later ones, and reports the result of
+// exactly these: a session that keeps sending must not delay its own flush. Threads: any; no
+// function blocks. A `done` callback runs on the thread that resolves the last message, or that
+// calls flush() or giveUp(), with no lock held. Owners: the session, and each of its messages until
+// it is resolved.
 class AckLedger {
  public:
   using Done = std::function<void(const AckTally&)>;
   using Number = std::uint64_t;
   using FlushId = std::uint64_t;
 
-  // Begins the account of a message, which must be resolved once.
+  // Counts a message in; the caller must resolve the returned number exactly once.
   [[nodiscard]] Number add() HALVOX_EXCLUDES(mutex_);
   void resolve(Number message, AckOutcome outcome) HALVOX_EXCLUDES(mutex_);
 
-  // Calls `done` exactly once: when all are resolved, which may be before this returns, or when the
-  // flush is given up.
+  // Calls `done` exactly once: when all messages are resolved, possibly before this returns, or
+  // from giveUp(). Returns 0 when `done` has run already.
   FlushId flush(Done done) HALVOX_EXCLUDES(mutex_);
-  // Ends the wait of a flush, if it still waits: what is unresolved counts as not acknowledged.
+  // Ends a flush that still waits; its unresolved messages count as not acknowledged. Does nothing
+  // for a flush that is done.
   void giveUp(FlushId id) HALVOX_EXCLUDES(mutex_);
 
  private:
@@ -54,7 +57,7 @@ class AckLedger {
 
   Mutex mutex_;
   Account current_ HALVOX_GUARDED_BY(mutex_);
-  std::list<Account> flushes_ HALVOX_GUARDED_BY(mutex_);  // that wait, the oldest first
+  std::list<Account> flushes_ HALVOX_GUARDED_BY(mutex_);  // waiting, oldest first
 };
 
 }  // namespace halvox::platform::linux_

@@ -7,23 +7,23 @@
 
 namespace halvox::platform::linux_ {
 
-// Decides which failures of a burst are worth a line: the first, then one a second with the number
-// of all since. Belongs to whoever locks around it.
+// Limits the log lines of a burst of failures: the first failure gets a line, then at most one line
+// a second that stands for all failures since the line before. Not thread-safe: the owner locks.
 class BurstLog {
  public:
   using Time = std::chrono::steady_clock::time_point;
 
-  // How many failures the line stands for; none when there shall be no line now.
+  // Adds failures. Returns how many the caller shall log now; none for no line.
   [[nodiscard]] std::optional<std::uint64_t> note(std::uint64_t failures, Time now) {
-    unsaid_ += failures;
+    unlogged_ += failures;
     if (last_ && now - *last_ < kPause) return std::nullopt;
     last_ = now;
-    return std::exchange(unsaid_, 0);
+    return std::exchange(unlogged_, 0);
   }
 
  private:
   static constexpr std::chrono::seconds kPause{1};
-  std::uint64_t unsaid_ = 0;
+  std::uint64_t unlogged_ = 0;
   std::optional<Time> last_;
 };
 

@@ -11,8 +11,9 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
+// For the threads of the library, which have no work left. More means that one of them hangs.
 constexpr std::chrono::milliseconds kLibraryEndTime{2000};
-constexpr std::int64_t kDefaultSpin = -1;
+constexpr std::int64_t kDefaultSpin = -1;  // how long the library spins on its locks
 }  // namespace
 
 NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environment)
@@ -25,7 +26,8 @@ NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environme
   // A connection would open the library, but messages are made, and may be destroyed, before the
   // first connection.
   if (const natsStatus status = nats_Open(kDefaultSpin); status != NATS_OK) {
-    kLog.error("the client library of the link does not start: ", natsStatus_GetText(status));
+    kLog.error("cannot start the NATS client library: ", natsStatus_GetText(status),
+               "; no server can be reached");
   }
 }
 
@@ -45,7 +47,7 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
       waiters_.push_back({waiter, std::exchange(found, nullptr)});
     }
   }
-  if (!failure.empty()) kLog.error("no server of the link is looked for: ", failure);
+  if (!failure.empty()) kLog.error("a session starts without NATS servers: ", failure);
   if (waiter == 0) {
     // No thread of ours to call back on.
     return dispatch_.asyncAfterOnBackgroundQueue(
@@ -71,14 +73,14 @@ void NatsLink::expire(std::uint64_t waiter) {
 std::optional<Error> NatsLink::refusal(std::size_t bytes) {
   if (closeBy_) return refusedByLink("the service is ending");
   if (maxPayload_ > 0 && bytes > maxPayload_) {
-    return refusedByLink("a message of " + std::to_string(bytes) + " bytes is more than the " +
-                         std::to_string(maxPayload_) + " that the server takes");
+    return refusedByLink("the message has " + std::to_string(bytes) +
+                         " bytes; the NATS server accepts at most " + std::to_string(maxPayload_));
   }
   // The attempt that just failed answers for this message, too: the sender learns at once that
   // messages are lost instead of after another time-out.
   if (state_ == State::kIdle && !lastFailure_.empty() &&
       std::chrono::steady_clock::now() < nextAttempt_) {
-    return refusedByLink("no server was reached: " + lastFailure_);
+    return refusedByLink("cannot connect to a NATS server: " + lastFailure_);
   }
   if (const std::string failure = provideThread(); !failure.empty()) return refusedByLink(failure);
   return std::nullopt;
@@ -122,7 +124,7 @@ bool NatsLink::close() {
     changed_.notifyAll();
   }
   if (!awaitThread()) {
-    kLog.notice("the link ends without waiting for a server any longer");
+    kLog.notice("a NATS server does not answer; closing without it, unsent messages are dropped");
     giveUpRest();
     keepForEver();
     return false;
@@ -130,7 +132,8 @@ bool NatsLink::close() {
   // Once the library has ended, it calls no callback. Otherwise one may still run, and this object
   // must stay.
   if (nats_CloseAndWait(kLibraryEndTime.count()) == NATS_OK) return true;
-  kLog.error("the client library of the link did not end in time");
+  kLog.error("the NATS client library did not end within ", kLibraryEndTime.count(),
+             " ms; leaving it running until the process ends");
   keepForEver();
   return true;
 }
@@ -171,7 +174,7 @@ std::string NatsLink::provideThread() {
     thread_ = std::thread([this] { run(); });
     return {};
   } catch (const std::system_error& error) {
-    return std::string("no thread for the link: ") + error.what();
+    return std::string("cannot start the thread of the NATS link: ") + error.what();
   }
 }
 

@@ -28,27 +28,27 @@ namespace halvox::platform::linux_ {
 //   lost: the library has closed the connection, for example because a server refused our
 //         credentials. The thread drops it; the next need makes a new one.
 //
-// All callers that ask for servers wait for the one attempt under way, at most kDiscoveryTime.
-// After a failed attempt the next one begins at the earliest kAttemptPause later, and only on
-// demand: an idle service without servers makes no wake-ups.
+// There is at most one attempt to connect at a time; all callers of discover() wait for it, at most
+// kDiscoveryTime. After a failed attempt, the next one begins on demand, and not before
+// kAttemptPause has passed: an idle service without servers makes no wake-ups.
 //
-// An attempt of the library cannot be cancelled. It holds the lock of its connection object, and
-// nothing bounds the time that a server may take for a TLS handshake. So close() waits a bounded
-// time and otherwise leaves the thread behind, after everything that it was to deliver is
-// abandoned.
+// An attempt of the library cannot be cancelled: it holds the lock of its connection object. It can
+// take for ever, because the library sets no time limit for a TLS handshake. close() therefore
+// waits a bounded time. If the thread still hangs then, close() abandons all messages and leaves
+// the thread behind.
 //
 // Threads: all public functions may be called by any thread; only close() blocks. Locks: this
 // class's lock first, then the publisher's, never the other way round.
-// Owner: NatsTlmReportingService, and whoever waits for a time-out of a discovery.
+// Owner: NatsTlmReportingService. Delayed jobs of discover() hold a weak reference.
 class NatsLink : public std::enable_shared_from_this<NatsLink> {
  public:
   // Less than the 9 seconds that a session waits for its back-ends.
   static constexpr std::chrono::seconds kDiscoveryTime{8};
-  // The load that a service without servers puts on the network, also with many sessions.
+  // Bounds the load on the network when many sessions start while no server answers.
   static constexpr std::chrono::seconds kAttemptPause{1};
-  // For what was taken before close() to be acknowledged; slow machines need more than one second.
+  // How long close() waits for acknowledgements. Slow machines need more than one second.
   static constexpr std::chrono::seconds kCloseTime{3};
-  // How long close() waits for an attempt under way; longer rarely helps, see above.
+  // How long close() waits for an attempt under way. An attempt that takes longer usually hangs.
   static constexpr std::chrono::milliseconds kAttemptEndTime{500};
   // More than the sum of the library's limits for the end of a connection: the drain and a write.
   static constexpr std::chrono::seconds kConnectionEndTime{5};
@@ -62,15 +62,16 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   // link's thread, also when a server is connected already; or with nothing, on the background
   // queue after kDiscoveryTime or on the thread after a failed attempt.
   void discover(TLMReportingService::BackendsCallback found) HALVOX_EXCLUDES(mutex_);
-  // The error for a message after close(), which is counted as refused; none before. Ask before
-  // making a message: after close() the library has ended, and must not even make one.
+  // After close(), counts a message as refused and returns the error for its sender; before,
+  // returns none. Call it before creating a message: after close() the library has ended, and
+  // creating a message would crash.
   [[nodiscard]] std::optional<Error> refuseAtEnd() HALVOX_EXCLUDES(mutex_);
-  // Queues the message, or returns why not: the service ends, the message is larger than the server
-  // takes, the queue is full, or no server was reached a moment ago.
+  // Queues the message. Returns an error if the service is ending, the message is larger than the
+  // server accepts, the queue is full, or an attempt to connect failed within kAttemptPause.
   [[nodiscard]] std::optional<Error> send(OutgoingMessage message) HALVOX_EXCLUDES(mutex_);
-  // Publishes what was taken, for at most kCloseTime, then ends the connection and the library.
-  // Returns false if the thread was left behind: this object then stays until the process ends,
-  // and everything that it was made with must do so, too. Further calls return the same.
+  // Publishes queued messages for at most kCloseTime, then ends the connection and the library.
+  // Returns false if the thread was left behind: this object then exists until the process ends,
+  // and so must `environment`. Further calls return the same.
   [[nodiscard]] bool close() HALVOX_EXCLUDES(mutex_);
 
  private:

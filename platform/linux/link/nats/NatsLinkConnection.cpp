@@ -155,7 +155,7 @@ void NatsLink::connect() {
     context_ = std::move(context);
     lastFailure_.clear();
   }
-  kLog.notice("the link is connected");
+  kLog.notice("connected to NATS");
   onAvailable(opened);
 }
 
@@ -170,7 +170,9 @@ void NatsLink::failAttempt(const std::string& failure) {
     nextAttempt_ = now + kAttemptPause;
     worthALine = attemptLog_.note(1, now);
   }
-  if (worthALine) kLog.error("no server of the link was reached: ", failure);
+  if (worthALine)
+    kLog.error("cannot connect to a NATS server: ", failure,
+               "; trying again when a session needs it");
   publisher_.failQueued("no server");
   answerWaiters();
 }
@@ -238,7 +240,7 @@ void NatsLink::onAway(natsConnection* connection) {
     publisher_.holdAfterLoss();
     changed_.notifyAll();
   }
-  kLog.notice("the link lost its server and looks for it");
+  kLog.notice("lost the connection to NATS; reconnecting, messages wait");
 }
 
 void NatsLink::onClosed(natsConnection* connection) {

@@ -34,7 +34,7 @@ TEST(NatsLinkTest, WithoutAThreadThereAreNoServersAndMessagesAreRefused) {
   EXPECT_EQ(answers, 1);
   EXPECT_FALSE(servers.has_value());
   ASSERT_TRUE(error.has_value());
-  EXPECT_THAT(error->description, testing::HasSubstr("no thread for the link"));
+  EXPECT_THAT(error->description, testing::HasSubstr("cannot start the thread of the NATS link"));
   EXPECT_TRUE(isEnded);
 }
 

@@ -6,9 +6,10 @@
 
 namespace halvox::platform::linux_ {
 
+// The piece under which the back-end counts, see platform/statistics.h.
 inline constexpr std::string_view kNatsPiece = "link to NATS";
 
-// The category of all lines about the link.
+// The log category of the NATS back-end.
 LogCategory& natsLogCategory();
 
 }  // namespace halvox::platform::linux_

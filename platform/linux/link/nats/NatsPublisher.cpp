@@ -53,8 +53,8 @@ NatsPublisher::NatsPublisher(const Configuration::Link& options, StatisticsServi
 std::optional<Error> NatsPublisher::take(OutgoingMessage& message) {
   const MutexLock lock(mutex_);
   if (queuedBytes_ + message.bytes > kQueueBytes) {
-    return refusedByLink("no room: " + std::to_string(queue_.size()) +
-                         " messages wait for the server");
+    return refusedByLink("the queue to NATS is full: " + std::to_string(queue_.size()) +
+                         " messages wait for a server");
   }
   queuedBytes_ += message.bytes;
   queue_.push_back(std::move(message));
@@ -232,7 +232,7 @@ void NatsPublisher::provideStreamAgain() {
   nextStreamCheck_ = std::chrono::steady_clock::now() + kStreamCheckPause;
   ackTime_ = std::min<std::chrono::nanoseconds>(kAckTime, provision.duplicates / 2);
   if (provision.failure.empty() || !streamLog_.note(1, now)) return;
-  kLog.error("no server of the link takes messages: ", provision.failure);
+  kLog.error("NATS accepts no messages: ", provision.failure, "; messages wait");
 }
 
 // Takes back from the library the messages that it still awaits acknowledgements for, to publish
@@ -284,7 +284,8 @@ void NatsPublisher::hold(std::span<NatsMessage> messages, natsStatus status) {
   }
   wake_();
   if (worthALine)
-    kLog.notice("messages of the link wait to be published again: ", natsStatus_GetText(status));
+    kLog.notice("NATS did not accept messages (", natsStatus_GetText(status),
+                "); publishing them again in order");
 }
 
 void NatsPublisher::holdAfterLoss() {
@@ -355,8 +356,7 @@ void NatsPublisher::countFailure(std::uint64_t messages, std::string_view reason
     worthALine = failureLog_.note(messages, std::chrono::steady_clock::now());
   }
   if (worthALine) {
-    kLog.error("messages of the link that no server confirmed: ", *worthALine,
-               ", the last: ", reason);
+    kLog.error("messages not delivered to NATS: ", *worthALine, ", reason of the last: ", reason);
   }
 }
 

@@ -41,37 +41,36 @@ struct OutgoingMessage {
 //   probing: the oldest unacknowledged message was published again, alone. Its acknowledgement
 //            lets all later unacknowledged messages follow in order, and then the queue.
 //
-// One probe first, because messages published while a cluster elects a leader are dropped at
-// random, and the rest would overtake them. The stream confirms a message that it already has, by
-// its identifier, without storing it twice. This keeps the order of a session's messages even when
-// the leader of the stream is lost. One exception: if the leader changes faster than a message
-// travels to the server and back, a later message can be stored before an earlier one.
+// Why one probe first: while a cluster elects a leader, it drops some messages and stores others. A
+// later message would overtake an earlier one. The stream recognises a message that it already has
+// by its identifier, and acknowledges it without storing it twice. This keeps the order of a
+// session's messages even when the leader of the stream is lost. One exception: if the leader
+// changes faster than a message travels to the server and back, a later message can be stored
+// before an earlier one.
 //
 // A probe that nobody responds to can mean that the stream was deleted or that its server lost its
 // files. The publisher then creates the stream again. A message without an acknowledgement within
 // kAckTime of its first attempt is abandoned and counted as not acknowledged.
 //
-// Threads: take(), refuse() and beginEnd() may be called by any thread, the next group by any
-// thread for reading; everything below "the link's thread only" by that thread alone. Library
-// threads call onAcknowledged(). Only the link's thread ever waits for a server. `wake` is called
-// without a lock of this class held, and may lock the owner; so the owner may call any function
-// with its own lock held unless that function publishes.
+// Threads: any, except for the functions marked "link's thread only". A thread of the library calls
+// onAcknowledged(). Only the link's thread ever waits for a server.
+// Locks: `wake` may lock the owner, and is called with no lock of this class held. The owner may
+// hold its own lock when it calls a function, unless the function is for the link's thread only.
 // Owner: NatsLink, which keeps the publisher until the library has ended.
 class NatsPublisher {
  public:
   using Time = std::chrono::steady_clock::time_point;
 
-  // An election in a cluster takes seconds, a restart of a server up to half a minute. Also half
-  // of the shortest time for which our streams recognise identifiers, with reserve.
+  // Long enough for a cluster to elect a leader, and for most restarts of a server. At most half of
+  // the time for which the stream recognises identifiers, see NatsStream.cpp.
   static constexpr std::chrono::seconds kAckTime{30};
-  // Long enough not to load a cluster that elects a leader, short beside the election itself.
+  // The pause between two probes. Short compared with an election, which takes seconds.
   static constexpr std::chrono::milliseconds kResendPause{100};
-  // A lookup of the stream is a request to all servers of a cluster; probes come every
-  // kResendPause.
+  // The pause between two lookups of the stream. A lookup costs a cluster more than a probe.
   static constexpr std::chrono::seconds kStreamCheckPause{2};
-  // What waits while servers are away. The largest request of a client fits (32 MiB), and more
-  // than 30,000 ordinary messages of 1 KiB do: 30 seconds of a busy service. More would only delay
-  // the error that tells a client's session that the link is broken.
+  // Bytes that wait while servers are away: as much as the largest request of a client, or about
+  // 37,000 messages of 886 bytes, the size of an ordinary one with its headers. A larger queue
+  // would delay the error by which a session learns that the link is broken.
   static constexpr std::size_t kQueueBytes = 32U << 20U;
 
   // `wake` makes the link's thread look for work again.
@@ -83,11 +82,13 @@ class NatsPublisher {
 
   // Counts a message that a session sends, before it is taken or refused.
   void countReceived() { received_.add(); }
-  // Queues the message and moves from it; or says why not and leaves it as it is.
+  // Queues the message and moves from it. If the queue is full, returns the error and leaves
+  // `message` unchanged.
   [[nodiscard]] std::optional<Error> take(OutgoingMessage& message) HALVOX_EXCLUDES(mutex_);
-  // Accounts for a message that nobody took; its sender gets the error.
+  // Accounts for a message that was not queued; its sender gets the error.
   void refuse(const OutgoingMessage& message);
-  // From here on `wake` is also called when the last acknowledgement has come.
+  // From now on, the last pending acknowledgement calls `wake`, too. Not before: with little
+  // traffic, every acknowledgement is the last one, and would wake the thread for nothing.
   void beginEnd() HALVOX_EXCLUDES(mutex_);
   // Abandons everything, queued or unacknowledged.
   void abandonAll() HALVOX_EXCLUDES(mutex_);
@@ -102,19 +103,21 @@ class NatsPublisher {
   // Whether publishNext() would publish, provided that a server is connected.
   [[nodiscard]] bool canPublish(Time now) HALVOX_EXCLUDES(mutex_);
 
-  // The link's thread only.
-  // Publishes over `context` until detach(). The caller owns `context`.
+  // Link's thread only, down to detach().
+  // Publishes over `context` until detach(). The caller owns `context`. `duplicates` is the time
+  // for which the stream recognises identifiers.
   void attach(jsCtx* context, std::chrono::nanoseconds duplicates);
   void publishNext() HALVOX_EXCLUDES(mutex_);
   void abandonOverdue() HALVOX_EXCLUDES(mutex_);
-  // Fails what is queued: no server could be reached.
+  // Fails all queued messages, for example because no server could be reached.
   void failQueued(std::string_view reason) HALVOX_EXCLUDES(mutex_);
-  // The connection has ended: abandons what is unacknowledged. The queue stays for the next one.
+  // The connection has ended: abandons all unacknowledged messages. The queue stays for the next
+  // connection.
   void detach() HALVOX_EXCLUDES(mutex_);
 
-  // Any thread. The connection was lost; what is unacknowledged has to be published again.
+  // Any thread. The connection was lost: unacknowledged messages have to be published again.
   void holdAfterLoss() HALVOX_EXCLUDES(mutex_);
-  // The handler for the library's options; `publisher` is this object. On a library thread.
+  // The handler for the options of the library; `publisher` points to this object.
   static void onAcknowledged(jsCtx* context, natsMsg* message, jsPubAck* ack, jsPubAckErr* error,
                              void* publisher);
 

@@ -8,8 +8,8 @@ namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
-// The limits of a stream that this service creates: what a reader who is absent for a month needs,
-// on a disk that other streams share.
+// The limits of a stream that this service creates. A reader can be absent for a month; 4 GiB
+// bounds what a busy service takes of the server's disk in that time.
 constexpr std::int64_t kStreamBytes = std::int64_t{4} << 30;
 constexpr std::chrono::nanoseconds kStreamAge = std::chrono::hours(24 * 30);
 
@@ -41,7 +41,7 @@ StreamProvision provideStream(jsCtx* context, const Configuration::Link& options
     return provision;
   }
   if (status != NATS_NOT_FOUND && code != JSStreamNotFoundErr) {
-    provision.failure = "stream " + options.stream + ": " + describe(status);
+    provision.failure = "cannot look up stream " + options.stream + ": " + describe(status);
     return provision;
   }
   const std::string subjects = options.subject + ".>";
@@ -57,10 +57,10 @@ StreamProvision provideStream(jsCtx* context, const Configuration::Link& options
   stream.Replicas = static_cast<std::int64_t>(options.replicas);
   stream.Duplicates = kDuplicatesTime.count();
   status = js_AddStream(info.out(), context, &stream, nullptr, &code);
-  if (status == NATS_OK) kLog.notice("made the stream ", options.stream);
+  if (status == NATS_OK) kLog.notice("created the NATS stream ", options.stream);
   // Another service may have created it since the lookup.
   if (status != NATS_OK && code != JSStreamNameExistErr) {
-    provision.failure = "stream " + options.stream + " cannot be made: " + describe(status);
+    provision.failure = "cannot create stream " + options.stream + ": " + describe(status);
   }
   return provision;
 }

@@ -9,7 +9,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The services that the back-end uses, which must outlive it.
+// The services that the back-end uses. They must outlive it.
 struct NatsEnvironment {
   DispatchService& dispatch;
   StatisticsService& statistics;
@@ -18,17 +18,18 @@ struct NatsEnvironment {
 // The real-time reporting framework over NATS with JetStream.
 class NatsTlmReporting : public TLMReportingService {
  public:
-  // Refuses what comes later, lets what was taken go out within a few seconds, tells whoever still
-  // waits, and ends the connection. Blocks; call it once no other thread calls. False when a thread
-  // is left behind that waits for a server: what it uses, the environment too, must then stay until
-  // the process ends.
+  // Refuses further messages, publishes for up to 3 seconds what was accepted, calls back everybody
+  // who still waits, and ends the connection. Blocks, for at most about 10 seconds; call it when no
+  // other thread uses the back-end. Returns false if a thread still waits for a server, which the
+  // NATS client library cannot interrupt: the environment must then stay until the process ends.
   [[nodiscard]] virtual bool close() = 0;
 };
 
-// Whether this build has that back-end.
+// Whether this build has the NATS back-end.
 [[nodiscard]] bool isNatsBuilt();
 
-// The back-end; null when it is not in this build. Connects nowhere before a session asks.
+// Makes the back-end; returns null if this build does not have it. It connects when the first
+// session starts: a service whose sessions never start needs no server.
 [[nodiscard]] std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(
     Configuration::Link options, const NatsEnvironment& environment);
 

@@ -16,10 +16,10 @@ namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsTlmReportingService");
 constexpr const char* kMessageIdHeader = "Nats-Msg-Id";
-// What the header adds to a message, roughly: it counts where a server limits sizes.
+// Roughly what the header adds to a message. Servers include it in their limit of sizes.
 constexpr std::size_t kHeaderBytes = 80;
 
-// Keeps its buffer between messages, so each thread has one.
+// One for each thread, because it reuses its buffer.
 PayloadEncoder& encoder() {
   thread_local PayloadEncoder encoder;
   return encoder;
@@ -56,13 +56,13 @@ std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(Configuration::Link optio
   return std::make_unique<NatsTlmReportingService>(std::move(options), environment);
 }
 
-// What all messages of a session have in common, put together once. Immutable but for its ledger.
+// A session: what all its messages have in common, encoded once. Immutable except for its ledger.
 class NatsTlmReportingService::LinkedSession final : public TLMReportingSession {
  public:
   LinkedSession(const std::string& subject, const Dictionary& sessionInfo,
                 const Dictionary& userInfo)
       : id_(sessionIdOf(sessionInfo)) {
-    // A client can choose the service name by its configuration, and not only as a string.
+    // Clients set the service name in their configuration, and may set a value that is no string.
     const Value* const service = userInfo.find(kTLMReportingUserInfoServiceName);
     const std::string_view name = service == nullptr ? std::string_view() : service->string();
     subject_ = subject + "." + subjectToken(name) + "." + id_;
@@ -78,7 +78,7 @@ class NatsTlmReportingService::LinkedSession final : public TLMReportingSession 
   [[nodiscard]] std::string description() const override { return subject_; }
   [[nodiscard]] const std::string& subject() const { return subject_; }
   [[nodiscard]] const std::string& beginning() const { return beginning_; }
-  // None for a session that does not batch.
+  // Null for a session that does not batch.
   [[nodiscard]] const std::shared_ptr<AckLedger>& ledger() const { return ledger_; }
 
  private:

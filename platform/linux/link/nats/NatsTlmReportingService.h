@@ -8,16 +8,21 @@
 
 namespace halvox::platform::linux_ {
 
-// The real-time reporting framework over NATS: turns each message into one JSON object
+// The real-time reporting framework over NATS. Encodes each message as one JSON object
 //
 //   {"sessionInfo":{…},"userInfo":{…},"category":n,"type":n,"payload":{…}}
 //
-// on the subject <subject>.<service name>.<session ID>, with an identifier by which the stream
-// knows it again. A session that batches has its acknowledgements collected: its flush waits for
-// them, at most kFlushTime. Nobody waits for those of other sessions; they are only counted.
-// Any thread may call, as the port says; nothing blocks but close().
+// and publishes it on the subject <subject>.<service name>.<session ID>, with an identifier by
+// which the stream recognises a second copy. A flush of a session that batches waits for the
+// acknowledgements of its messages, at most kFlushTime. Other sessions have no flush; their
+// acknowledgements are only counted.
+// Threads: any, as the port says; only close() blocks.
+// Failures: a message that cannot be accepted is answered with an error; see NatsLink for what
+// happens to accepted messages.
 class NatsTlmReportingService final : public NatsTlmReporting {
  public:
+  // Long enough for a second attempt to publish, see NatsPublisher. After it, the flush reports how
+  // many messages are not acknowledged.
   static constexpr std::chrono::seconds kFlushTime{5};
 
   NatsTlmReportingService(Configuration::Link options, const NatsEnvironment& environment);
@@ -41,11 +46,11 @@ class NatsTlmReportingService final : public NatsTlmReporting {
   TLMReportingOutcome send(const LinkedSession& session, const TLMReportingMessage& message);
 
   const std::string subject_;
-  const std::string instance_;  // unlike that of any other run of any service
+  const std::string instance_;  // random, unique to this run of the service
   DispatchService& dispatch_;
-  std::atomic<std::uint64_t> lastToken_{0};  // orders with nothing, as the next one
+  std::atomic<std::uint64_t> lastToken_{0};  // orders nothing; neither does the next
   std::atomic<std::uint64_t> lastMessage_{0};
-  const std::shared_ptr<NatsLink> link_;  // shared by those who wait for time to pass
+  const std::shared_ptr<NatsLink> link_;  // shared with delayed jobs of the link
 };
 
 }  // namespace halvox::platform::linux_

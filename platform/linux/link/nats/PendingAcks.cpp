@@ -26,7 +26,7 @@ PendingAcks::Entry PendingAcks::settle(Slot& slot) {
   return std::move(slot.entry);
 }
 
-// Leaves unsettled ones at the front and at the next to be published again.
+// Restores two invariants: the first slot is unsettled, and so is the next one to publish again.
 void PendingAcks::skipSettled() {
   while (!slots_.empty() && slots_.front().isSettled) {
     slots_.pop_front();

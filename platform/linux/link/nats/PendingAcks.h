@@ -14,57 +14,61 @@
 
 namespace halvox::platform::linux_ {
 
-// How much may be on its way to a server without its acknowledgement.
+// How much may be published without an acknowledgement: what has to be published again after a
+// failure, and what the client library holds in addition to our queue.
 struct AckWindow {
   std::size_t messages = 8192;
   std::size_t bytes = 16U << 20U;
 };
 
-// The messages that were published and not acknowledged yet, in the order in which they were
-// published first. Each is either with the client library, known by its address there, or was given
-// back and is held for another attempt. A window bounds them; what is held counts too.
+// The messages that were published and are not yet acknowledged, in the order of their first
+// attempts. The client library has a message, and reports about it by its address, or it was given
+// back and is held here for another attempt. Both count in the window.
 //
-// After a failure, beginAgain() goes back to the oldest; nextAgain() then tells one by one what to
-// publish again, before anything new is added, so that the order stays.
-// Belongs to whoever locks around it.
+// After a failure, beginAgain() returns to the oldest message, and nextAgain() gives one after the
+// other to publish again. Nothing new may be added before needsAgain() is false; this keeps the
+// order.
+// Not thread-safe: the owner locks.
 class PendingAcks {
  public:
   using Time = std::chrono::steady_clock::time_point;
   struct Entry {
-    std::shared_ptr<AckLedger> ledger;  // none when nobody flushes
+    std::shared_ptr<AckLedger> ledger;  // null when no flush waits for it
     AckLedger::Number number = 0;
     std::size_t bytes = 0;
-    Time deadline;  // never before that of an older one
+    Time deadline;  // not before that of an older message
   };
 
   explicit PendingAcks(AckWindow window) : window_(window) {}
 
-  // One message more may go, however large it is.
+  // Whether one more message may be published. Its size does not matter: otherwise a message larger
+  // than the window could never be published.
   [[nodiscard]] bool hasRoom() const { return size_ < window_.messages && bytes_ < window_.bytes; }
-  // Half of the window is free, so that it is worth going on.
+  // Whether half of the window is free. The publisher waits for this after a full window: waking it
+  // for each acknowledgement would cost more than the publishing.
   [[nodiscard]] bool isHalfFree() const {
     return size_ <= window_.messages / 2 && bytes_ <= window_.bytes / 2;
   }
   [[nodiscard]] std::size_t size() const { return size_; }
-  // When the oldest is given up; none when there is no message.
+  // When the oldest message is overdue; none without messages.
   [[nodiscard]] std::optional<Time> firstDeadline() const;
 
-  // Only while nothing has to be published again.
+  // Call only while needsAgain() is false.
   void add(const natsMsg* message, Entry entry);
-  // What is known of a message that the library is done with, which is then gone; none when it was
-  // given up before.
+  // Removes a message that the library has reported about; returns none if it was overdue before.
   std::optional<Entry> take(const natsMsg* message);
-  // Holds a message that the library gave back for another attempt. False when it was given up.
+  // Holds a message that the library gave back. Returns false if it was overdue before.
   bool giveBack(NatsMessage message);
 
   void beginAgain() { again_ = first_; }
-  // Older messages have to be published again before anything new.
+  // Whether messages must be published again before anything new.
   [[nodiscard]] bool needsAgain() const { return again_ < first_ + slots_.size(); }
-  // The next of them is here: it is not when the library is just about to tell what became of it.
+  // Whether the next of them is held here. It is not while the library is about to report about it.
   [[nodiscard]] bool hasAgain() const { return needsAgain() && slots_[again_ - first_].held; }
-  // The next of them, to be published at once; call it only when there is one.
+  // Removes and returns the next of them, to be published at once. Call only if hasAgain().
   NatsMessage nextAgain();
 
+  // Removes and returns the messages whose deadline has passed, oldest first.
   std::vector<Entry> takeOverdue(Time now);
   std::vector<Entry> takeAll() { return takeOverdue(Time::max()); }
 
@@ -72,7 +76,7 @@ class PendingAcks {
   struct Slot {
     Entry entry;
     NatsMessage held{};
-    bool isSettled = false;  // and stays until all older ones are settled
+    bool isSettled = false;  // but stays until all older ones are
   };
 
   Entry settle(Slot& slot);
@@ -80,11 +84,11 @@ class PendingAcks {
 
   const AckWindow window_;
   std::deque<Slot> slots_;
-  std::uint64_t first_ = 0;  // the number of the first slot; the others follow
-  std::uint64_t again_ = 0;  // the number of the next to be published again; the end when none
+  std::uint64_t first_ = 0;  // number of the first slot
+  std::uint64_t again_ = 0;  // number of the next to publish again; one past the last if none
   std::unordered_map<const natsMsg*, std::uint64_t> atLibrary_;
-  std::size_t size_ = 0;   // of what is not settled
-  std::size_t bytes_ = 0;  // of what is not settled
+  std::size_t size_ = 0;   // of unsettled slots
+  std::size_t bytes_ = 0;  // of unsettled slots
 };
 
 }  // namespace halvox::platform::linux_
