@@ -51,7 +51,7 @@ std::string listDomains() {
   return list;
 }
 
-// "Session_99": a category that has no name, in a domain.
+// Parses "Session_99": a category without a name, in a domain.
 std::optional<client::Category> parseNumberInDomain(std::string_view text) {
   const auto separator = text.find('_');
   if (separator == std::string_view::npos) return std::nullopt;
@@ -70,18 +70,18 @@ ArgumentError unknown(std::string_view text, const std::string& expected) {
 Parsed<client::ReporterID> parseReporterID(std::string_view text) {
   if (const auto id = parseWhole<client::ReporterID>(text)) return *id;
   return ArgumentError{"\"" + std::string(text) +
-                       "\" is no reporter ID; expected a whole number of 64 bits, such as 7"};
+                       "\" is not a reporter ID; expected a whole number of 64 bits, such as 7"};
 }
 
 Parsed<std::int64_t> parseNumber(std::string_view text) {
   if (const auto number = parseWhole<std::int64_t>(text)) return *number;
-  return ArgumentError{"\"" + std::string(text) + "\" is no number; expected a whole number"};
+  return ArgumentError{"\"" + std::string(text) + "\" is not a number; expected a whole number"};
 }
 
 Parsed<std::uint64_t> parseCount(std::string_view text) {
   if (const auto count = parseWhole<std::uint64_t>(text)) return *count;
   return ArgumentError{"\"" + std::string(text) +
-                       "\" is no number; expected a whole number from 0 on, such as 10"};
+                       "\" is not a number; expected a whole number of 0 or more, such as 10"};
 }
 
 Parsed<client::Category> parseCategory(std::string_view text) {
@@ -89,7 +89,7 @@ Parsed<client::Category> parseCategory(std::string_view text) {
   if (const auto category = client::findCategory(text)) return *category;
   if (const auto category = parseNumberInDomain(text)) return *category;
   return unknown(text, "a number of 32 bits or one of " + listNames(client::categories()) +
-                           ", alone or behind one of " + listDomains());
+                           ", alone or after one of " + listDomains());
 }
 
 Parsed<client::EventType> parseEventType(std::string_view text) {
@@ -109,7 +109,7 @@ Parsed<std::chrono::milliseconds> parseSeconds(std::string_view text) {
   const auto seconds = parseReal(text);
   if (!seconds || *seconds <= 0 || *seconds > kMost) {
     return ArgumentError{"\"" + std::string(text) +
-                         "\" is no time; expected seconds, more than 0, such as 0.5 or 10"};
+                         "\" is not a time; expected seconds, more than 0, such as 0.5 or 10"};
   }
   return std::chrono::ceil<std::chrono::milliseconds>(std::chrono::duration<double>(*seconds));
 }

@@ -9,8 +9,8 @@
 
 #include "client/HalvoxClient.h"
 
-// The texts of single arguments as what they stand for. Each function says, when it cannot, what
-// was wrong and what was expected.
+// Converts the texts of single arguments to values. On failure the message says what was found and
+// what was expected. Pure functions: any thread may call.
 namespace halvox::tools {
 
 struct ArgumentError {
@@ -19,16 +19,16 @@ struct ArgumentError {
 template <typename T>
 using Parsed = std::variant<T, ArgumentError>;
 
-// Whole numbers, decimal or with 0x hexadecimal.
+// A 64-bit whole number, decimal, or hexadecimal after 0x.
 Parsed<client::ReporterID> parseReporterID(std::string_view text);
 Parsed<std::int64_t> parseNumber(std::string_view text);
-// How many: a whole number from 0 on, decimal or with 0x hexadecimal.
+// A whole number of 0 or more, decimal, or hexadecimal after 0x.
 Parsed<std::uint64_t> parseCount(std::string_view text);
-// Names in any case of letters, or numbers.
+// A name in upper or lower case, or a number.
 Parsed<client::Category> parseCategory(std::string_view text);
 Parsed<client::EventType> parseEventType(std::string_view text);
 Parsed<client::ServiceType> parseServiceType(std::string_view text);
-// Seconds, fractions allowed; more than 0.
+// A number of seconds, more than 0; fractions are allowed.
 Parsed<std::chrono::milliseconds> parseSeconds(std::string_view text);
 
 }  // namespace halvox::tools

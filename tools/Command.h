@@ -9,41 +9,41 @@
 #include <string>
 #include <utility>
 
-// What every command of halvoxctl has: how it is run, with what, and how it ends.
+// What all commands of halvoxctl have in common: their options, streams and exit statuses.
 namespace halvox::tools {
 
-// How a run of halvoxctl ends; documented in its manual page.
+// The exit status of halvoxctl. The manual page documents these for users.
 enum class ExitStatus : int {
   kDone = 0,
-  kRefused = 1,       // the service said no
-  kBadArguments = 2,  //
-  kNoService = 69,    // EX_UNAVAILABLE: nobody answers, the connection was lost, there is no store
-  kCannotWrite = 74,  // EX_IOERR: standard output takes nothing, a file cannot be read or changed
-  kBadConfiguration = 78,  // EX_CONFIG
+  kRefused = 1,            // the service refused, or what was asked for does not exist
+  kBadArguments = 2,       // wrong arguments, or a named file that cannot be used
+  kNoService = 69,         // EX_UNAVAILABLE: no service, no answer, connection lost, or no store
+  kCannotWrite = 74,       // EX_IOERR: standard output or a file cannot be written or changed
+  kBadConfiguration = 78,  // EX_CONFIG: the configuration file is wrong
 };
 
 enum class OutputForm : std::uint8_t { kText, kJson };
 
-// What all commands take.
+// The options that every command takes.
 struct CommonOptions {
   bool json = false;
-  std::string socket;  // empty: the client's default
+  std::string socket;  // empty: the usual places
   std::chrono::milliseconds timeout{5000};
 
   [[nodiscard]] OutputForm form() const { return json ? OutputForm::kJson : OutputForm::kText; }
 };
 
-// What a program has to read from and write to.
+// The streams of one run. Does not own them.
 struct ToolStreams {
   std::istream& input;
   std::ostream& output;
   std::ostream& errors;
-  int outputDescriptor = -1;  // what `output` writes to
+  int outputDescriptor = -1;  // the descriptor behind `output`; -1 if it has none
   bool isInputTerminal = false;
 };
 
-// A command line that was understood: what it asks for, in the type of its command, and the
-// function that carries it out.
+// A parsed command line: the request, in the type of its command, and the function that carries it
+// out.
 class Command {
  public:
   template <typename Asked>
@@ -57,7 +57,7 @@ class Command {
           return carryOut(*command.asked<Asked>(), command.options, streams);
         }) {}
 
-  // Null when the command asks for something else.
+  // Returns null if the request is of another type.
   template <typename Asked>
   [[nodiscard]] const Asked* asked() const {
     return std::any_cast<Asked>(&asked_);

@@ -16,10 +16,10 @@ namespace halvox::tools {
 namespace {
 
 constexpr const char* kExitStatusNote =
-    "Exit status: 0 done, 1 the service said no, 2 bad arguments, 69 no service or no store, "
+    "Exit status: 0 done, 1 refused or failed, 2 bad arguments, 69 no service or no store, "
     "74 the output or a file cannot be written, 78 bad configuration.";
 
-// Where the commands of a group may stand.
+// Where the commands of a group may be used.
 enum class GroupPlace : std::uint8_t { kAnywhere, kArguments, kScriptLines };
 
 struct CommandGroup {
@@ -28,7 +28,7 @@ struct CommandGroup {
   GroupPlace place;
 };
 
-// All commands there are, in the order of the help.
+// All commands, in the order of the help.
 constexpr CommandGroup kGroups[] = {
     {"Requests to the service", addRequestCommands, GroupPlace::kAnywhere},
     {"Waiting", addScriptRequests, GroupPlace::kScriptLines},
@@ -53,7 +53,7 @@ bool isFor(GroupPlace place, CommandSource source) {
   return false;
 }
 
-// An argument's name says what it is; the library's word for its type, TEXT, says nothing.
+// Removes the library's type name TEXT: the name of the argument already says what it is.
 void leaveTypesOut(CLI::App& app) {
   for (CLI::Option* option : app.get_options()) {
     if (option->get_positional()) option->type_name("");
@@ -71,7 +71,7 @@ void addGroups(CommandSet& commands, CommandSource source) {
   }
 }
 
-// The library has the options of a program before its command; a line has none there.
+// The library shows options before the command in a usage line. A script's line has none there.
 class HelpFormatter final : public CLI::Formatter {
  public:
   std::string make_usage(const CLI::App* app, std::string name) const override {
@@ -80,7 +80,7 @@ class HelpFormatter final : public CLI::Formatter {
   }
 };
 
-// What the library calls by names of its own, in ours; commands take it from the program.
+// Replaces the library's headings by ours; commands inherit them from the program.
 void nameThings(CLI::App& app) {
   app.set_help_flag("-h,--help", "Print this help");
   const auto formatter = std::make_shared<HelpFormatter>();
@@ -91,7 +91,7 @@ void nameThings(CLI::App& app) {
   app.formatter(formatter);
 }
 
-// The command that was given, then the one below it that was: none, one or two.
+// Returns the command that was given and its sub-command: none, one or two.
 std::vector<const CLI::App*> chosenOf(const CLI::App& app) {
   std::vector<const CLI::App*> chosen;
   for (auto below = app.get_subcommands(); !below.empty();
@@ -101,7 +101,7 @@ std::vector<const CLI::App*> chosenOf(const CLI::App& app) {
   return chosen;
 }
 
-// "halvoxctl trace show", as far as the command was given; a script's lines are without the first.
+// Returns "halvoxctl trace show" as far as the command was given, without the program in a script.
 std::string nameOf(const CLI::App& app, const std::vector<const CLI::App*>& chosen) {
   std::string name = app.get_name();
   for (const CLI::App* command : chosen) {
@@ -110,7 +110,7 @@ std::string nameOf(const CLI::App& app, const std::vector<const CLI::App*>& chos
   return name;
 }
 
-// The library leaves lines as long as they come and a gap where options are hidden.
+// Wraps long lines, and removes the gap that the library leaves for hidden options.
 std::string laidOut(const std::string& help) {
   constexpr std::size_t kWidth = 100;
   constexpr std::size_t kDescriptions = 30;  // the column they stand in
@@ -149,7 +149,7 @@ std::string listCommands(const CLI::App& app) {
   return list;
 }
 
-// What is wrong, in our words where the library's would not help.
+// Returns what is wrong, in our words where the library's do not help.
 std::string reasonOf(const CLI::ParseError& error, const CLI::App& app, const CLI::App& command) {
   const bool isWithoutCommand = dynamic_cast<const CLI::RequiredError*>(&error) != nullptr &&
                                 command.get_require_subcommand_min() > 0 &&
@@ -162,7 +162,7 @@ std::string reasonOf(const CLI::ParseError& error, const CLI::App& app, const CL
   return what + "; expected " + listCommands(command);
 }
 
-// "halvoxctl send: --type: …": which command, which argument, what is wrong with it.
+// Returns "halvoxctl send: --type: …": the command, the argument, and what is wrong with it.
 CommandLineText describe(const CLI::ParseError& error, const CLI::App& app, CommandSource source) {
   auto chosen = chosenOf(app);
   const std::string prefix = nameOf(app, chosen);
@@ -188,7 +188,8 @@ std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string>
   nameThings(app);
   CommandSet commands(app, source, input);
   if (source == CommandSource::kScriptLine) {
-    app.description("Requests to the Halvox reporting service, one a line, over one connection.");
+    app.description(
+        "Requests to the Halvox reporting service, one on each line, over one connection.");
     app.footer(
         "'COMMAND --help' explains a command; 'quit' or the end of the input ends the shell.");
   } else {
@@ -202,7 +203,7 @@ std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string>
   leaveTypesOut(app);
 
   std::ranges::reverse(arguments);  // as the library wants them
-  // Exceptions are the library's own way to report; none leaves this function.
+  // The library reports everything with exceptions. None leaves this function.
   try {
     app.parse(std::move(arguments));
   } catch (const CLI::CallForHelp&) {

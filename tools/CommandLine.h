@@ -10,25 +10,27 @@
 
 namespace halvox::tools {
 
-// What halvoxctl prints instead of carrying out a command: the help or the version that was asked
-// for (kDone), or what is wrong with the arguments (kBadArguments).
+// What halvoxctl prints instead of carrying out a command: help or version (kDone), or an error in
+// the arguments (kBadArguments).
 struct CommandLineText {
   ExitStatus status = ExitStatus::kDone;
   std::string text;
-  // Of what is wrong: the command, as far as it was given, and the reason alone.
+  // For an error: the command, as far as it was given, and the reason without it.
   std::string command{};
   std::string reason{};
 };
 
-// Whether these arguments ask for JSON, even when they are wrong otherwise.
+// Returns true if these arguments ask for JSON output, even if they are otherwise wrong: the error
+// is then printed as JSON too.
 bool asksForJson(const std::vector<std::string>& arguments);
 
 enum class CommandSource : std::uint8_t {
-  kArguments,   // of the program
-  kScriptLine,  // requests only; the connection is there already
+  kArguments,   // the arguments of the program: all commands
+  kScriptLine,  // a line of a script: only requests, over the script's connection
 };
 
-// Reads the arguments without the program's name. `input` is read when a JSON argument is "-".
+// Parses the arguments without the program's name. Reads `input` to its end if a JSON argument is
+// "-". Throws nothing.
 std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string> arguments,
                                                         CommandSource source, std::istream& input);
 

@@ -88,7 +88,7 @@ TEST(CommandLineTest, SendNeedsEitherIDsOrAll) {
             "halvoxctl send: --id: is missing; expected --id ID for some sessions or --all for the "
             "active");
   EXPECT_EQ(errorOf({"send", "--all", "--id", "7", "--category", "1", "--type", "1", "{}"}),
-            "halvoxctl send: --id: goes with no --all; expected one of the two");
+            "halvoxctl send: --id: cannot be combined with --all; expected one of the two");
 }
 
 TEST(CommandLineTest, ADashReadsTheDictionaryFromTheInput) {
@@ -206,12 +206,13 @@ TEST(CommandLineTest, ASnapshotIsShownOrExtracted) {
 
 TEST(CommandLineTest, ErrorsNameTheCommandAndTheArgument) {
   EXPECT_EQ(errorOf({"create", "x"}),
-            "halvoxctl create: ID: \"x\" is no reporter ID; expected a whole number of 64 bits, "
+            "halvoxctl create: ID: \"x\" is not a reporter ID; expected a whole number of 64 bits, "
             "such as 7");
   EXPECT_EQ(errorOf({"create"}), "halvoxctl create: ID is required");
-  EXPECT_EQ(errorOf({"list", "--timeout", "0"}),
-            "halvoxctl list: --timeout: \"0\" is no time; expected seconds, more than 0, such as "
-            "0.5 or 10");
+  EXPECT_EQ(
+      errorOf({"list", "--timeout", "0"}),
+      "halvoxctl list: --timeout: \"0\" is not a time; expected seconds, more than 0, such as "
+      "0.5 or 10");
   EXPECT_EQ(errorOf({"configure", "7", "{"}),
             "halvoxctl configure: JSON: line 1, column 2: expected a name in double quotes, found "
             "the end of the text");
@@ -219,9 +220,10 @@ TEST(CommandLineTest, ErrorsNameTheCommandAndTheArgument) {
 
 TEST(CommandLineTest, CountsAndActionsThatAreNoneAreNamedWithWhatIsExpected) {
   for (const std::string command : {"events", "metrics", "power", "link", "snapshots", "summary"}) {
-    EXPECT_EQ(errorOf({command, "--last", "x"}),
-              "halvoxctl " + command +
-                  ": --last: \"x\" is no number; expected a whole number from 0 on, such as 10");
+    EXPECT_EQ(
+        errorOf({command, "--last", "x"}),
+        "halvoxctl " + command +
+            ": --last: \"x\" is not a number; expected a whole number of 0 or more, such as 10");
     EXPECT_NE(errorOf({command, "--last", "-1"}), "");
   }
   EXPECT_EQ(errorOf({"preferences", "frob", "org.example"}),
@@ -239,7 +241,7 @@ TEST(CommandLineTest, PreferencesAreGotSetAndUnset) {
 TEST(CommandLineTest, ErrorsNameTheCommandBelowAnother) {
   EXPECT_EQ(errorOf({"trace", "export", "f"}), "halvoxctl trace export: --to is required");
   EXPECT_EQ(errorOf({"link", "--session", "x"}),
-            "halvoxctl link: --session: \"x\" is no number; expected a whole number");
+            "halvoxctl link: --session: \"x\" is not a number; expected a whole number");
 }
 
 TEST(CommandLineTest, AnUnknownCommandIsAnsweredWithTheKnownOnes) {

@@ -15,13 +15,15 @@
 #include "tools/Command.h"
 #include "tools/CommandLine.h"
 
-// What the groups of commands in tools/commands/ build their arguments with.
+// Helpers with which the files in tools/commands/ define the arguments of commands.
 namespace halvox::tools {
 
-// Whether a command speaks to the service or works on its files.
+// Whether a command sends requests to the service or works on its files. Options for the connection
+// are shown only for the former.
 enum class CommandReach : std::uint8_t { kService, kFiles };
 
-// What a command says of itself: `summary` in the list of commands, the rest in its own help.
+// The help of a command: `summary` stands in the list of commands, the rest in the command's own
+// help.
 struct CommandText {
   const char* name;
   const char* summary;
@@ -30,36 +32,38 @@ struct CommandText {
   CommandReach reach = CommandReach::kService;
 };
 
-// The commands of one command line, and the one that it turned out to ask for. What a command's
-// options are read into belongs to that command's functions; see onRun(). Throws the exceptions of
-// the parsing library, which parseCommandLine() catches.
+// All commands that a command line may name, and the one that it did name. The function that
+// defines a command also owns the object that its options are parsed into; see onRun(). Throws the
+// exceptions of the parsing library, which parseCommandLine() catches.
 class CommandSet {
  public:
   // `app` and `input` must outlive it.
   CommandSet(CLI::App& app, CommandSource source, std::istream& input);
 
-  // The commands that follow stand under this heading in the list of commands.
+  // Sets the heading under which the commands that are added next are listed.
   void beginGroup(const char* heading) { heading_ = heading; }
   CLI::App& add(const CommandText& text);
-  // A command of a command: halvoxctl PARENT NAME.
+  // Adds a sub-command: halvoxctl PARENT NAME.
   CLI::App& addBelow(CLI::App& parent, const CommandText& text);
 
-  // Says what `app` comes to when it is the command that was given: make() returns what is asked
-  // for, once all arguments have been read, or throws when they do not go together.
+  // Sets what happens if `app` is the command that was given. make() is called after all arguments
+  // were parsed; it returns the request, or throws if the arguments do not fit together. run()
+  // carries the request out.
   template <typename Make, typename Run>
   void onRun(CLI::App& app, Make make, Run run) {
     app.callback([this, make, run] {
-      // A command below another is called first, and is the one that is meant.
+      // The library calls the callback of a sub-command before that of its parent. The sub-command
+      // is the one that was given.
       if (!command_) command_.emplace(make(), Command::Run<decltype(make())>(run));
     });
   }
 
-  // What stands before the command and behind it.
+  // The common options, whether they stand before or after the command.
   [[nodiscard]] const CommonOptions& options() const { return options_; }
-  // What "-" stands for; a script's lines have no input of their own.
+  // Returns the standard input, for an argument "-". Throws in a script, whose lines are the input.
   std::string readInput();
 
-  // What was asked for; once, and only after a line was read without an exception.
+  // Returns the command that was given. Call once, and only after parsing succeeded.
   Command take();
 
  private:
@@ -73,7 +77,7 @@ class CommandSet {
   std::optional<Command> command_;
 };
 
-// The value of `parsed`; throws, in the name of the argument `shown`, when it is none.
+// Returns the value of `parsed`. Throws an error about the argument `shown` if it has none.
 template <typename T>
 T valueOf(Parsed<T> parsed, const std::string& shown) {
   if (const auto* error = std::get_if<ArgumentError>(&parsed)) {
@@ -82,8 +86,8 @@ T valueOf(Parsed<T> parsed, const std::string& shown) {
   return std::get<T>(std::move(parsed));
 }
 
-// An argument or option that one of the functions of tools/Arguments.h understands. It is read into
-// `target`, which must live as long as `app`.
+// Adds an argument or option that a function of tools/Arguments.h parses into `target`, which must
+// live as long as `app`.
 template <typename T, typename Target>
 CLI::Option* addParsed(CLI::App& app, const std::string& name, Target& target,
                        Parsed<T> (*parse)(std::string_view), const std::string& description) {
@@ -93,7 +97,7 @@ CLI::Option* addParsed(CLI::App& app, const std::string& name, Target& target,
       description);
 }
 
-// The same for an option that may be given several times; adds to `targets`.
+// The same for an option that may be given several times; appends each value to `targets`.
 template <typename T, typename Targets>
 CLI::Option* addEach(CLI::App& app, const std::string& name, Targets& targets,
                      Parsed<T> (*parse)(std::string_view), const std::string& description) {
@@ -108,7 +112,8 @@ CLI::Option* addEach(CLI::App& app, const std::string& name, Targets& targets,
       ->take_all();
 }
 
-// An option with or without a number of seconds; `given` hears of it with the number or none.
+// Adds an option with an optional number of seconds. Calls `given` if the option is used, with the
+// number or nothing.
 CLI::Option* addOptionalSeconds(CLI::App& app, const std::string& name,
                                 std::function<void(std::optional<std::chrono::milliseconds>)> given,
                                 const std::string& description);

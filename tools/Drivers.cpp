@@ -25,7 +25,7 @@ using platform::IOReportChannel;
 using platform::IOReportFormat;
 using platform::IOReportService;
 
-// What the sources complain of, as complaints of this program. Any thread.
+// Prints errors of the sources as errors of this program. Any thread.
 class ErrorLog final : public platform::LogCategory {
  public:
   ErrorLog() : LogCategory(platform::LogLevel::kError) {}
@@ -47,7 +47,7 @@ std::string count(Number value, std::optional<double> seconds) {
   return seconds ? numberText(static_cast<double>(value) / *seconds) : std::to_string(value);
 }
 
-// What a person reads of a number per second: no more digits than the measured time is good for.
+// A rate for people, with no more digits than the measured time justifies.
 std::string rateText(double rate) {
   constexpr double kNoFractionFrom = 1000;
   constexpr double kThreeDecimals = 1000;
@@ -133,7 +133,7 @@ std::string jsonLine(const IOReportChannel& channel, std::optional<double> secon
   return harmlessJson(json + "}");
 }
 
-// Samples the channels that the request chose.
+// Samples the channels that the request selected.
 class DriverPrinter {
  public:
   DriverPrinter(IOReportService& service, const ShowDrivers& request, OutputForm form,
@@ -162,7 +162,7 @@ class DriverPrinter {
     out_.flush();
   }
 
-  // Until nobody reads the output any more.
+  // Ends when nobody reads the output any more.
   void watch(std::chrono::milliseconds interval, int outputDescriptor) {
     using Clock = std::chrono::steady_clock;
     auto before = sample();
@@ -192,7 +192,7 @@ class DriverPrinter {
   IOReportService::Subscription subscription_;
 };
 
-// "the groups are Rx, Tx", of the channels that there are now.
+// Returns "the groups are Rx, Tx" for the current channels.
 std::string groupsOf(IOReportService& service) {
   std::optional<platform::IOReportError> error;
   auto channels = service.IOReportCopyChannelsInGroup(std::nullopt, std::nullopt, error);
@@ -204,7 +204,7 @@ std::string groupsOf(IOReportService& service) {
         if (channel.group) groups.emplace(*channel.group);
         return 0;
       });
-  if (groups.empty()) return "there are no channels at all now";
+  if (groups.empty()) return "there are no channels now";
   std::string list;
   for (const std::string& group : groups) list += (list.empty() ? "" : ", ") + group;
   return (groups.size() == 1 ? "the only group is " : "the groups are ") + list;
@@ -222,7 +222,7 @@ ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream
   const Complaint complain("drivers", form, out, errors);
   const auto configuration = serviceConfiguration(complain);
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
-  // Lives as long as the process, because the sources' log remembers it.
+  // Static, because the sources' log keeps a reference to it.
   static ErrorLog errorLog;
   platform::linux_::ownDriversCategory() = &errorLog;
   platform::linux_::CounterStatisticsService statistics;

@@ -10,20 +10,20 @@
 
 namespace halvox::tools {
 
-// The driver channels that there are.
+// A request for the driver channels.
 struct ShowDrivers {
-  std::string group{};  // empty: all
+  std::string group{};  // empty: all groups
   std::optional<std::chrono::milliseconds> watch{};
 };
 
-// One channel on one line, without its end. With `seconds` its counts are those of that time and
-// are shown per second; else they are shown as they are.
+// Formats one channel on one line, without a line end. With `seconds` the counts are those of that
+// time and are shown per second; otherwise they are shown as they are.
 std::string formatChannel(const platform::IOReportChannel& channel, std::optional<double> seconds,
                           OutputForm form);
 
-// Prints the driver channels that there are now with their values, read from the sources that the
-// configuration names; with --watch what they change by per second, until the output is closed.
-// `outputDescriptor` is what `out` writes to.
+// Prints the current driver channels with their values, read from the sources that the
+// configuration names. With --watch, prints their changes per second until the output is closed.
+// `outputDescriptor` is the descriptor behind `out`. Does not need the service.
 ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream& out,
                        int outputDescriptor, std::ostream& errors);
 

@@ -16,7 +16,7 @@ std::string formatEvent(const StoredEvent& event, OutputForm form) {
     return localTime(event.time) + "  " + harmlessText(event.name) + "  " +
            fieldsOfJson(event.payload);
   }
-  // The payload is JSON already, on one line and complete: that is the store's promise.
+  // The store guarantees that the payload is complete JSON on one line.
   return "{\"time\":" + toJson(event.time) + ",\"name\":" + harmlessJson(quoted(event.name)) +
          ",\"payload\":" + harmlessJson(event.payload) + "}";
 }

@@ -9,12 +9,14 @@
 
 namespace halvox::tools {
 
-// One event on one line, without its end: the local time, the name and the payload's fields, or a
-// JSON object with "time", "name" and "payload". What a client sent cannot drive a terminal.
+// Formats one event on one line, without a line end: the local time, the name and the payload's
+// fields, or a JSON object with "time", "name" and "payload". Escapes characters of the payload
+// that could control a terminal.
 std::string formatEvent(const platform::linux_::StoredEvent& event, OutputForm form);
 
-// Prints the stored events that were asked for, newest last; with --follow until the output is
-// closed or the store's directory is gone. `outputDescriptor` is what `out` writes to.
+// Prints the selected events, newest last. With --follow, goes on with new events until the output
+// is closed or the directory of the store is deleted. `outputDescriptor` is the descriptor behind
+// `out`.
 ExitStatus showEvents(const RecordSelection& request, OutputForm form, std::ostream& out,
                       int outputDescriptor, std::ostream& errors);
 

@@ -12,7 +12,7 @@ namespace {
 
 constexpr std::size_t kLongestCharacter = 4;  // bytes of UTF-8
 
-// What was expected where; none for an error that is not about the next character.
+// Returns what was expected; empty for an error that is not about the next character.
 std::string_view expectationOf(int code) {
   switch (static_cast<rapidjson::ParseErrorCode>(code)) {
     case rapidjson::kParseErrorValueInvalid:
@@ -66,7 +66,7 @@ std::string_view sentenceOf(int code) {
   }
 }
 
-// The character at the place where the text has been read to.
+// Returns the next character of the text, for an error message.
 std::string foundIn(std::istream& text) {
   std::string character;
   while (character.size() < kLongestCharacter) {

@@ -27,7 +27,8 @@ using platform::Dictionary;
 using platform::Value;
 using Writer = rapidjson::Writer<rapidjson::StringBuffer>;
 
-// What the wire can hold at most: a dictionary is a level of its own and one of the variant in it.
+// The deepest nesting that fits on the wire, where each dictionary counts twice: once for itself
+// and once for the variant around a value in it.
 constexpr int kMaxDepth = 32;
 constexpr unsigned kParseFlags = rapidjson::kParseFullPrecisionFlag |
                                  rapidjson::kParseIterativeFlag |
@@ -37,7 +38,7 @@ std::string_view textOf(const rapidjson::Value& value) {
   return {value.GetString(), value.GetStringLength()};
 }
 
-// Turns parsed JSON into values, and remembers where it was when it could not.
+// Converts parsed JSON to values. After a failure it knows the place.
 class Converter {
  public:
   bool convert(const rapidjson::Value& json, Dictionary& dictionary) {
@@ -122,8 +123,8 @@ void write(Writer& writer, std::string_view text) {
   writer.String(text.data(), static_cast<rapidjson::SizeType>(text.size()));
 }
 
-// A number as short as it reads back, which the library's own form is not always. In JSON it keeps
-// a fraction, so that it reads back as a double: 1.0.
+// The shortest form of a number that reads back the same; the library's own form is sometimes
+// longer. JSON keeps a fraction (1.0), so that the number reads back as a double.
 std::string jsonNumber(double number) {
   std::string text = shortNumber(number);
   return text.find_first_not_of("-0123456789") == std::string::npos ? text + ".0" : text;
@@ -202,7 +203,7 @@ void write(Writer& writer, const Value& value) {
   }
 }
 
-// Characters that a terminal acts upon, or that make a line look like another one.
+// Characters that control a terminal, or that make a line look like another one.
 bool isHarmful(char32_t character) {
   const bool isControl = character < 0x20 || (character >= 0x7F && character <= 0x9F);
   const bool isSeparator = character == 0x2028 || character == 0x2029;
@@ -243,7 +244,7 @@ bool canStandWithoutQuotes(std::string_view text) {
   return !text.empty() && text.find_first_of(" \"'=\\{}[],") == std::string_view::npos;
 }
 
-// Writes parsed JSON again, with numbers for people.
+// Writes parsed JSON again, with numbers in the form for people.
 class FieldWriter final : public Writer {
  public:
   using Writer::Writer;

@@ -9,30 +9,30 @@
 // Dictionaries as JSON, and text that is safe to show.
 namespace halvox::tools {
 
-// A JSON object as a dictionary. Whole numbers keep their 64 bits, others are doubles, true and
-// false are booleans. Null has no form in a message: it is refused with its place, as are a key
-// that occurs twice and anything but one object.
+// Parses a JSON object. Whole numbers keep their 64 bits, other numbers become doubles, true and
+// false become booleans. It is an error, with its place, if the text is anything but one object,
+// has a null, which messages cannot hold, or has a key twice.
 Parsed<platform::Dictionary> parseDictionary(std::string_view json);
 
-// A finite number with as few digits as it takes to read the same number back: "0.1", "48000".
+// Formats a finite number with the fewest digits that read back as the same number: "0.1", "48000".
 std::string shortNumber(double number);
 
-// A value as JSON on one line: dates as RFC 3339 text, data as hexadecimal text, and numbers that
-// JSON cannot hold as the texts "NaN", "Infinity" and "-Infinity".
+// Formats a value as JSON on one line. Dates become RFC 3339 text, data becomes hexadecimal text,
+// and numbers that JSON cannot hold become the texts "NaN", "Infinity" and "-Infinity".
 std::string toJson(const platform::Value& value);
 
-// A text as a JSON string with its quotes. Bytes that are not UTF-8 become U+FFFD.
+// Formats a text as a JSON string with quotes. Bytes that are not UTF-8 become U+FFFD.
 std::string quoted(std::string_view text);
 
-// JSON text with every character in it that could drive a terminal or reorder a line written as an
-// escape. Such characters occur inside strings only, so the meaning stays.
+// Escapes the characters of a JSON text that could control a terminal or reorder a line. They occur
+// only inside strings, so the meaning stays the same.
 std::string harmlessJson(std::string_view json);
 
-// A text on one line in which nothing can drive a terminal: control characters as escapes.
+// Makes a text safe to print on one line: control characters become escapes.
 std::string harmlessText(std::string_view text);
 
-// The fields of a JSON object as "key=value" with blanks between; texts stand without quotes where
-// that leaves no doubt. What is no JSON object is shown as it is.
+// Formats the fields of a JSON object as "key=value" with blanks between. Texts have no quotes
+// unless they would be ambiguous. Returns other text than a JSON object unchanged.
 std::string fieldsOfJson(std::string_view json);
 
 }  // namespace halvox::tools

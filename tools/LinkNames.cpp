@@ -37,8 +37,8 @@ std::string tagOf(const StoredRecord& message) {
   return {tag.GetString(), tag.GetStringLength()};
 }
 
-// What stands before the category proper in the text of a category: "Session_", "_" for a domain
-// that has no name, or nothing.
+// Returns the part before the category proper in the name of a category: "Session_", "_" for a
+// domain without a name, or nothing.
 std::string domainOf(Category category) {
   const std::string name = client::categoryName(category);
   return name.substr(0, name.size() - client::categoryName(category & kCategoryProper).size());
@@ -50,7 +50,7 @@ bool isDomain(std::string_view text) {
          });
 }
 
-// The domain in the message's tag; nothing where the tag says something else than the numbers.
+// Returns the domain in the message's tag; nothing if the tag does not agree with the numbers.
 std::string domainOf(const StoredRecord& message) {
   const std::string tag = tagOf(message);
   const std::string rest = client::categoryName(categoryProperOf(message)) +

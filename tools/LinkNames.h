@@ -6,21 +6,21 @@
 
 #include "platform/linux/store/reading/StoreReader.h"
 
-// The names of what the link stored as numbers.
+// Names of the numbers in stored link messages.
 namespace halvox::tools {
 
-// The category of a stored link message with its domain, as --category takes it:
-// "Session_Playback". A category that has no name is its number: "99", "Session_99". The link's own
-// number has no domain; it comes from the tag that the session put into the payload
-// ("Session_PlaybackStart"), where that agrees with the numbers.
+// Returns the category of a stored message with its domain, in the form of --category:
+// "Session_Playback". A category without a name is its number: "99", "Session_99". The stored
+// number has no domain; the domain comes from the tag that the session put into the payload
+// ("Session_PlaybackStart"), if the tag agrees with the numbers.
 std::string linkCategoryName(const platform::linux_::StoredRecord& message);
 
-// The type of a stored link message, as --type takes it: "Start", or its number when it has no
+// Returns the type of a stored message in the form of --type: "Start", or its number if it has no
 // name.
 std::string linkTypeName(const platform::linux_::StoredRecord& message);
 
-// Whether the message is of one of the categories. A category without a domain stands for all
-// domains; an empty list for all categories.
+// Returns true if the message has one of the categories. A category without a domain matches every
+// domain; an empty list matches every category.
 bool isOfCategory(const platform::linux_::StoredRecord& message,
                   std::span<const std::int64_t> categories);
 

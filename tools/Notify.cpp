@@ -24,7 +24,7 @@ using platform::linux_::UniqueFd;
 
 namespace {
 
-// What the service listens for.
+// The notifications that the service listens for.
 constexpr std::array<std::string_view, 2> kNotifications{
     "com.tarno.halvox.reporting", "com.tarno.pavisk.spatial-audio-accessory-feature.changed"};
 
@@ -56,7 +56,7 @@ ExitStatus postNotification(const PostNotification& request, OutputForm form, st
   const std::filesystem::path file = directory / request.name;
   constexpr int kFlags = O_WRONLY | O_CREAT | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
   const UniqueFd descriptor(::open(file.c_str(), kFlags, 0644));
-  // A file that was there is touched, so that its time tells of the last post.
+  // Touch a file that exists, so that its time is that of the last post.
   if (!descriptor || ::futimens(descriptor.get(), nullptr) != 0) {
     return complain(ExitStatus::kCannotWrite,
                     file.native() + ": " + platform::linux_::errnoText(errno));

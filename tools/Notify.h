@@ -7,13 +7,14 @@
 
 namespace halvox::tools {
 
+// A request to post a notification.
 struct PostNotification {
   std::string name{};
-  std::string directory{};  // empty: where the service's configuration puts it
+  std::string directory{};  // empty: as the service's configuration says
 };
 
-// Posts a notification to the service: touches the file of that name in the directory where it
-// looks for them, which is made when it is missing. Does not need the service to run.
+// Posts a notification: touches the file of that name in the directory that the service watches.
+// Creates a missing directory. The service need not run.
 ExitStatus postNotification(const PostNotification& request, OutputForm form, std::ostream& out,
                             std::ostream& errors);
 

@@ -73,7 +73,7 @@ ExitStatus set(const Preferences& request, const std::filesystem::path& file,
 
 ExitStatus unset(const Preferences& request, const std::filesystem::path& file,
                  const Complaint& complain) {
-  // Without a file nothing is made only to be looked into.
+  // Changing a missing file would create its directories, for nothing.
   std::error_code ignored;
   if (!std::filesystem::exists(file, ignored)) return nothingThere(request, complain);
   bool wasThere = true;

@@ -9,20 +9,20 @@
 
 namespace halvox::tools {
 
-// Settings that the service follows while it runs.
+// A request to show or change settings that the service follows while it runs.
 struct Preferences {
   enum class Action : std::uint8_t { kGet, kSet, kUnset };
   Action action = Action::kGet;
   std::string domain{};
-  std::optional<std::string> key{};    // none: all, to get
-  std::optional<std::string> value{};  // to set
-  bool isString = false;               // whatever the value looks like
+  std::optional<std::string> key{};    // none: get shows all keys
+  std::optional<std::string> value{};  // only for set
+  bool isString = false;               // take the value as a string, whatever it looks like
   std::string user = "mobile";
-  std::string directory{};  // empty: where the service's configuration puts it
+  std::string directory{};  // empty: as the service's configuration says
 };
 
-// Shows or changes settings that the service follows while it runs. Works on the files, so it does
-// not need the service to run. What there is nothing of (to get or to unset) is kRefused.
+// Shows or changes settings in their files. The service need not run; if it runs, it notices the
+// change. Returns kRefused if a key to get or unset does not exist.
 ExitStatus showOrChangePreferences(const Preferences& request, bool json, std::ostream& out,
                                    std::ostream& errors);
 

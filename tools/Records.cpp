@@ -54,11 +54,11 @@ const char* commandOf(ShowRecords::Kind kind) {
   return "";
 }
 
-// Field numbers of the metric.
+// The field numbers of the metric's message.
 enum AudioIssueField : std::uint8_t { kTimestamp = 1, kDuration, kIssueType, kNode, kRtaidClient };
 
-// The fields of the metric as a JSON object; none when the bytes are no such message. Strings that
-// are not UTF-8 are mended.
+// Returns the fields of the metric as a JSON object; nothing if the bytes are not such a message.
+// In strings, bytes that are not UTF-8 are replaced.
 std::optional<std::string> audioIssueAsJson(const std::string& bytes) {
   ProtoReader reader(std::as_bytes(std::span(bytes)));
   std::optional<std::uint64_t> timestamp;
@@ -102,7 +102,7 @@ std::string metricID(std::int64_t metric) {
   return text.data();
 }
 
-// The time, the number or name that the record goes by, and its fields.
+// Formats the time, the number or name that identifies the record, and its fields.
 std::string metricAsText(const StoredRecord& record) {
   const std::int64_t metric = record.number(store::kMetricID);
   const std::string& bytes = record.text(store::kMetricMessage);
@@ -129,7 +129,7 @@ std::string asText(ShowRecords::Kind kind, const StoredRecord& record) {
   return {};
 }
 
-// Columns that hold JSON already, on one line and complete: that is the store's promise.
+// The columns in which the store guarantees complete JSON on one line.
 bool isJson(std::string_view column) { return column == "payload" || column == "signature"; }
 
 std::string asJson(ShowRecords::Kind kind, const StoredRecord& record) {

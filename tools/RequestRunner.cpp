@@ -48,7 +48,7 @@ ExitStatus statusOf(Failure::Kind kind) {
 
 }  // namespace
 
-// One request on its way: has a function for each kind, and prints in the way that was asked for.
+// Carries out one request: has a function for each kind, which prints in the chosen form.
 class RequestRunner::Execution {
  public:
   Execution(RequestRunner& runner, bool json, const std::string& prefix)
@@ -108,7 +108,7 @@ class RequestRunner::Execution {
     if (!answer) return complain("valid", *answer.failure);
     const Value* id = answer.value->find("reporterID");
     const Value* type = answer.value->find("serviceType");
-    // The service answers with the ID 0 for a session that nobody has.
+    // The service answers with the ID 0 if the session does not exist.
     const bool isThere = id != nullptr && id->toInt64() == request.id && request.id != 0;
     const auto serviceType =
         type != nullptr ? static_cast<ServiceType>(type->toUInt64()) : kUnknownService;
@@ -159,11 +159,11 @@ class RequestRunner::Execution {
     return ExitStatus::kDone;
   }
 
-  // A request that says yes or no prints nothing when the answer was yes.
+  // For requests that are answered with yes or no: prints nothing after yes.
   ExitStatus report(const char* command, std::optional<ReporterID> id, const Result<bool>& result) {
     if (!result) return complain(command, *result.failure);
     if (!*result.value) {
-      return complain(command, {Failure::Kind::kRefused, "", "the service said no"});
+      return complain(command, {Failure::Kind::kRefused, "", "the service answered no"});
     }
     Dictionary fields{{"command", command}};
     if (id) fields.set("id", *id);
@@ -172,7 +172,7 @@ class RequestRunner::Execution {
     return ExitStatus::kDone;
   }
 
-  // That a start is not answered yet is no fault of the connection: the session just runs on.
+  // A start without an answer does not mean a broken connection: the session is still running.
   ExitStatus reportWait(const char* command, ReporterID id, std::chrono::milliseconds time) {
     const auto answer = connection_->waitForStartReply(id, time);
     if (answer || answer.failure->kind != Failure::Kind::kTimedOut) {
@@ -205,7 +205,8 @@ ExitStatus RequestRunner::run(const Request& request, bool json, const std::stri
   return std::visit(Execution(*this, json, prefix), request);
 }
 
-// What answers may be another service than the user thinks.
+// Warns that places before this one have sockets that nobody serves: the user may expect another
+// service.
 void RequestRunner::sayWhatWasPassedOver() {
   for (const std::string& path : connection_->unservedSockets()) {
     errors_ << "halvoxctl: nobody serves " << harmlessText(path) << "; using "

@@ -10,16 +10,16 @@
 
 namespace halvox::tools {
 
-// Carries requests out over one connection, which it makes at the first of them, and prints their
-// answers. Belongs to one thread.
+// Carries out requests over one connection and prints the answers. Connects at the first request.
+// Belongs to one thread. A request that fails prints the reason and returns its exit status.
 class RequestRunner {
  public:
-  // Where to connect to, and where answers and complaints go; `out` and `errors` must outlive it.
+  // Prints answers to `out` and failures to `errors`, which must outlive it.
   RequestRunner(CommonOptions options, std::ostream& out, std::ostream& errors)
       : options_(std::move(options)), out_(out), errors_(errors) {}
 
-  // `prefix` begins each complaint, before the name of the command: the program, and in a script
-  // the file and line.
+  // `prefix` stands before the name of the command in error messages: the program, or the file and
+  // line of a script.
   ExitStatus run(const Request& request, bool json, const std::string& prefix);
 
  private:

@@ -7,8 +7,8 @@
 
 #include "client/HalvoxClient.h"
 
-// The requests to the service, as the arguments of halvoxctl or the line of a script say them. Each
-// has the name of its command.
+// The requests to the service, as parsed from the arguments of halvoxctl or a line of a script.
+// Each has the name of its command.
 namespace halvox::tools {
 
 using client::Category;
@@ -38,7 +38,8 @@ struct Configure {
 struct Start {
   static constexpr const char* kCommand = "start";
   ReporterID id = 0;
-  std::optional<std::chrono::milliseconds> wait;  // for the answer, which comes at the stop
+  std::optional<std::chrono::milliseconds> wait;  // for the answer, which comes at the stop; none:
+                                                  // do not wait
 };
 struct Send {
   static constexpr const char* kCommand = "send";
@@ -65,7 +66,7 @@ struct List {
 struct Kill {
   static constexpr const char* kCommand = "kill";
 };
-// In scripts only: what one connection can see that a single command cannot.
+// Only in scripts, whose requests share a connection.
 struct WaitForStart {
   static constexpr const char* kCommand = "wait";
   ReporterID id = 0;

@@ -13,12 +13,12 @@ namespace {
 
 constexpr std::string_view kBlanks = " \t\r";
 
-// Takes the words of a line one by one.
+// Returns the words of a line one by one.
 class LineReader {
  public:
   explicit LineReader(std::string_view line) : rest_(line) {}
 
-  // False at the end of the line, or when there is something wrong with it.
+  // Returns false at the end of the line, or if the line has an error.
   bool next(std::string& word) {
     const auto start = rest_.find_first_not_of(kBlanks);
     rest_.remove_prefix(start == std::string_view::npos ? rest_.size() : start);

@@ -11,19 +11,19 @@
 
 namespace halvox::tools {
 
-// One request per line, over one connection.
+// A request to run a script: one request on each line, over one connection.
 struct RunScript {
   std::string file;  // "-": standard input
   bool keepGoing = false;
 };
 struct RunShell {};
 
-// The words of a line, by the shell's rules for blanks, quotes and backslashes, without any of its
-// expansions. A word that begins with "{" outside of quotes is the rest of the line as it stands,
-// so JSON needs no quotes. "#" at the beginning of a word ends the line.
+// Splits a line into words by the shell's rules for blanks, quotes and backslashes, without the
+// shell's expansions. A word that begins with "{" outside of quotes is the unchanged rest of the
+// line, so that JSON needs no quotes. "#" at the beginning of a word starts a comment.
 Parsed<std::vector<std::string>> splitLine(std::string_view line);
 
-// Where a script's lines come from and what they are called in complaints.
+// The lines of a script, and their name in error messages.
 struct ScriptSource {
   std::istream& lines;
   std::string name;
@@ -31,8 +31,8 @@ struct ScriptSource {
   bool keepsGoing = false;
 };
 
-// Carries out one request per line over one connection. The status is that of the first line that
-// failed; a lost connection ends the script in any case.
+// Carries out one request for each line over one connection. Returns the status of the first line
+// that failed. A lost connection always ends the script.
 ExitStatus runScript(const ScriptSource& source, const CommonOptions& options, std::ostream& out,
                      std::ostream& errors);
 

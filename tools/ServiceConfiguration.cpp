@@ -24,7 +24,7 @@ bool isSocketInTheEnvironment() {
   return value != nullptr && *value != '\0';
 }
 
-// The first of the usual places that has a store.
+// The first of the usual places that holds a store.
 struct StoreSearch {
   std::filesystem::path directory;  // the user's when there is no store
   bool isThere = false;
@@ -36,7 +36,7 @@ StoreSearch searchStore() {
   for (const auto& directory : {search.directory, platform::linux_::systemStorageDirectory()}) {
     const auto database = directory / kDatabaseName;
     struct stat status {};
-    // One that may not be looked at is there as far as anybody can tell.
+    // A store that this user may not look at counts as present.
     if (::stat(database.c_str(), &status) == 0 || !client::meansAbsence(errno)) {
       search.directory = directory;
       search.isThere = true;

@@ -9,26 +9,24 @@
 
 namespace halvox::tools {
 
-// The configuration of the service that this user's programs find. A storage directory that it does
-// not name is the user's when there is a store in that, else the system's when there is one in
-// that, else the user's. When the configuration is wrong, it is complained of and the exit status
-// is what there is.
+// Returns the configuration of the service that this user's programs find. If it does not name a
+// storage directory, that is the user's if it holds a store, else the system's if that holds one,
+// else the user's. If the configuration is wrong, reports it and returns the exit status.
 std::variant<platform::linux_::Configuration, ExitStatus> serviceConfiguration(
     const Complaint& complain);
 
-// The socket that `options` or the configuration names; empty when neither does, so that the client
-// looks in the usual places. A configuration that the system keeps from this user's eyes names
-// none; a wrong one is complained of. The configuration is only read when nothing before it names
-// one.
+// Returns the socket that `options`, $HALVOX_SOCKET or the configuration names; empty if none does,
+// and the client then tries the usual places. Reads the configuration only if the others name
+// nothing. A configuration that this user may not read names nothing; a wrong one is reported.
 std::variant<std::string, ExitStatus> namedSocket(const CommonOptions& options,
                                                   const Complaint& complain);
 
-// The directory of the store that the configuration names, else of the first of the user's and the
-// system's that is there. When there is none, all places are complained of. One that is named is
-// not looked at.
+// Returns the directory of the store: the one that the configuration names, without looking at it,
+// else the user's if it holds a store, else the system's if that holds one. If there is none,
+// reports all places that were tried.
 std::variant<std::filesystem::path, ExitStatus> findStore(const Complaint& complain);
 
-// The directory that --directory named, or the one that the service's configuration has there.
+// Returns the directory that --directory named, or else the configured one.
 std::variant<std::filesystem::path, ExitStatus> settingsDirectory(
     const std::string& named, std::filesystem::path platform::linux_::Configuration::*configured,
     const Complaint& complain);

@@ -28,15 +28,15 @@ using platform::Value;
 
 constexpr const char* kSignatureName = "signature.json";
 constexpr const char* kManifestName = "manifest.json";
-// One long name, which may come from anywhere, must not fill all lines with blanks.
+// Limits the width, so that one long name does not fill all lines with blanks.
 constexpr std::size_t kWidestColumn = 40;
 
-// The archive that an argument means, or how the run ends without one.
+// Returns the archive that an argument means, or the exit status if there is none.
 std::variant<fs::path, ExitStatus> findSnapshot(const std::string& file,
                                                 const Complaint& complain) {
   if (file.empty()) {
     return complain(ExitStatus::kBadArguments,
-                    R"(FILE: "" is no file; expected an archive, or "newest")");
+                    R"(FILE: "" is not a file; expected an archive, or "newest")");
   }
   if (file != "newest") return fs::path(file);
   const auto configuration = serviceConfiguration(complain);
@@ -62,7 +62,7 @@ struct Contents {
   Dictionary manifest;
 };
 
-// What a snapshot tells of itself, or what is wrong with it.
+// Returns the signature and manifest of a snapshot, or an error.
 std::variant<Contents, std::string> readContents(const fs::path& file) {
   auto read = readSnapshotFiles(file, {kSignatureName, kManifestName});
   if (!read) return std::move(read).error().message;
@@ -71,7 +71,7 @@ std::variant<Contents, std::string> readContents(const fs::path& file) {
   for (const auto& [name, target] : {std::pair(kSignatureName, &contents.signature),
                                      std::pair(kManifestName, &contents.manifest)}) {
     const auto text = texts.find(name);
-    if (text == texts.end()) return file.native() + ": it is no snapshot: it has no " + name;
+    if (text == texts.end()) return file.native() + ": not a snapshot: it has no " + name;
     auto parsed = parseDictionary(text->second);
     if (auto* error = std::get_if<ArgumentError>(&parsed)) {
       return file.native() + ": " + name + " in it: " + error->message;
@@ -131,7 +131,7 @@ void printText(const fs::path& file, const Contents& contents, std::ostream& out
   for (const Value& item : list) printItem(item.dictionary(), width, out);
 }
 
-// "20260301T120000Z-haptics-Generic" of the archive's name.
+// Returns the archive's name without its extension: "20260301T120000Z-haptics-Generic".
 std::string stemOf(const fs::path& file) {
   std::string name = file.filename().native();
   constexpr std::string_view kSuffix = ".tar.zst";

@@ -7,21 +7,23 @@
 
 namespace halvox::tools {
 
-// Archives of diagnostics; the file "newest" is the newest of the service's.
+// Requests about archives of diagnostics. The file "newest" stands for the newest one of the
+// service.
 struct ShowSnapshot {
   std::string file{};
 };
 struct ExtractSnapshot {
   std::string file{};
-  std::string directory{};  // empty: one named as the archive, in the working directory
-  bool force = false;       // replaces files that are there
+  std::string directory{};  // empty: named like the archive, in the working directory
+  bool force = false;       // replace existing files
 };
 
-// Prints what a snapshot is about and what is in it. What is in an archive cannot drive a terminal.
+// Prints the signature and the contents of a snapshot. Escapes characters that could control a
+// terminal.
 ExitStatus showSnapshot(const ShowSnapshot& request, OutputForm form, std::ostream& out,
                         std::ostream& errors);
 
-// Unpacks a snapshot and prints the files that it made.
+// Unpacks a snapshot and prints the names of its files.
 ExitStatus extractSnapshot(const ExtractSnapshot& request, OutputForm form, std::ostream& out,
                            std::ostream& errors);
 

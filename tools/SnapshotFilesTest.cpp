@@ -106,7 +106,7 @@ TEST_F(SnapshotFilesTest, AnEmptyNameIsABadArgument) {
   EXPECT_EQ(show(""), ExitStatus::kBadArguments);
   EXPECT_EQ(extract(""), ExitStatus::kBadArguments);
 
-  EXPECT_THAT(errors_.str(), HasSubstr("extract: FILE: \"\" is no file; expected an archive"));
+  EXPECT_THAT(errors_.str(), HasSubstr("extract: FILE: \"\" is not a file; expected an archive"));
 }
 
 TEST_F(SnapshotFilesTest, ALongNameDoesNotWidenTheOtherLines) {

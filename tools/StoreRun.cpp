@@ -20,7 +20,7 @@ using platform::linux_::StoreReader;
 constexpr const char* kDatabaseName = "halvox.db";
 constexpr std::uint64_t kShownWhenFollowing = 10;
 
-// The directory of the store, or how the run ends without one.
+// Returns the directory of the store, or the exit status if there is none.
 std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& run) {
   const std::string& database = run.selection.database;
   const Complaint complain(run.command, run.form, run.out, run.errors);
@@ -32,7 +32,7 @@ std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& r
     return path.has_parent_path() ? path.parent_path() : std::filesystem::path(".");
   }
   return complain(ExitStatus::kBadArguments, "--database: " + database +
-                                                 " is no store; expected a " + kDatabaseName +
+                                                 " is not a store; expected a " + kDatabaseName +
                                                  " or the directory that has one");
 }
 
@@ -41,7 +41,7 @@ ExitStatus cannotRead(const StoreRun& run, const StoreError& error) {
                                                                error.description, "no-store");
 }
 
-// Waits for the next records. False when nobody reads the output any more.
+// Waits for the next records. Returns false when nobody reads the output any more.
 bool waitForRecords(int storeDescriptor, int outputDescriptor) {
   std::array<pollfd, 2> polled{{{storeDescriptor, POLLIN, 0}, {outputDescriptor, 0, 0}}};
   while (poll(polled.data(), polled.size(), -1) < 0) {

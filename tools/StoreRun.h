@@ -13,38 +13,38 @@
 
 namespace halvox::tools {
 
-// Which stored records a command shows.
+// Selects the stored records that a command shows.
 struct RecordSelection {
-  std::vector<std::string> names{};  // glob patterns; none: all
+  std::vector<std::string> names{};  // glob patterns; empty: all names
   std::optional<double> since{};     // seconds since 1970
   std::optional<double> until{};
   std::optional<std::uint64_t> last{};
   bool follow = false;
-  std::string database{};  // empty: where the service's configuration puts it
+  std::string database{};  // empty: as the service's configuration says
 };
 
-// What a command that shows stored records of one kind is run with.
+// The arguments of runOverStore() that all kinds of records share.
 struct StoreRun {
-  std::string command;  // for the complaints
-  OutputForm form;      // of the complaints
+  std::string command;  // for error messages
+  OutputForm form;      // of error messages
   const RecordSelection& selection;
   std::ostream& out;
-  int outputDescriptor;  // what `out` writes to
+  int outputDescriptor;  // the descriptor behind `out`
   std::ostream& errors;
 };
 
-// How the records are read and printed: all that are there, or those that are new.
+// Reads and prints records: `all` those of a filter, `added` those that have come since.
 struct StoreReading {
   using Error = std::optional<platform::linux_::StoreError>;
   std::function<Error(platform::linux_::StoreReader&, const platform::linux_::RecordFilter&)> all;
   std::function<Error(platform::linux_::EventFollower&)> added;
 };
 
-// What the selection asks for, as the store's reader has it.
+// Converts a selection to the filter of the store's reader.
 platform::linux_::RecordFilter filterOf(const RecordSelection& selection);
 
-// Opens the store that the selection names and reads it, once or, with --follow, until the output
-// is closed or the store's directory is gone.
+// Opens the selected store and reads it once or, with --follow, until the output is closed or the
+// directory of the store is deleted.
 ExitStatus runOverStore(const StoreRun& run, const platform::linux_::RecordFilter& filter,
                         const StoreReading& reading);
 

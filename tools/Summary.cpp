@@ -94,7 +94,7 @@ bool read(const std::string& file, const SummaryMessageHandler& handler, Session
   return false;
 }
 
-// The table stands before the messages and needs all of them, so the file is read twice.
+// Reads the file twice: the table comes before the messages and needs all of them.
 ExitStatus showOne(const std::string& file, OutputForm form, std::ostream& out,
                    const Complaint& complain) {
   Session session;
@@ -112,7 +112,7 @@ ExitStatus showOne(const std::string& file, OutputForm form, std::ostream& out,
   return read(file, print, again, complain) ? ExitStatus::kDone : ExitStatus::kBadArguments;
 }
 
-// What is shown when some files are broken is still worth showing.
+// Broken files are reported, and the others are still shown.
 ExitStatus showTable(const std::vector<std::string>& files, OutputForm form, std::ostream& out,
                      const Complaint& complain) {
   std::vector<Session> sessions;
@@ -128,7 +128,7 @@ ExitStatus showTable(const std::vector<std::string>& files, OutputForm form, std
   return sessions.size() == files.size() ? ExitStatus::kDone : ExitStatus::kBadArguments;
 }
 
-// The newest summaries of the directory by the time in their names, newest last.
+// Returns the newest summaries of the directory by the time in their names, newest last.
 std::vector<std::string> newestIn(const fs::path& directory, std::uint64_t count,
                                   std::error_code& error) {
   std::vector<std::pair<std::int64_t, std::string>> found;

@@ -9,15 +9,15 @@
 
 namespace halvox::tools {
 
-// The summaries that the service leaves of its sessions on internal builds.
+// A request for summaries of sessions, which internal builds of the service write.
 struct ShowSummaries {
-  std::vector<std::string> files{};  // none: the newest of the service's
+  std::vector<std::string> files{};  // empty: the newest ones of the service
   std::uint64_t last = 10;
 };
 
-// Prints the summaries of sessions as a table, newest last: those of the files that were asked for,
-// or the newest that the service left; of a single file its messages too. As JSON, one object a
-// line. What cannot be read is told on `errors`, and the rest is shown.
+// Prints summaries of sessions as a table, newest last: those of the named files, or the newest
+// ones of the service. Also prints the messages if a single file is named. JSON output has one
+// object on each line. Reports files that cannot be read on `errors` and shows the others.
 ExitStatus showSummaries(const ShowSummaries& request, OutputForm form, std::ostream& out,
                          std::ostream& errors);
 

@@ -27,7 +27,7 @@ constexpr std::string_view kEnding = ".json";
 constexpr std::string_view kTimestampKey = "hvreporting_timestamp";
 constexpr std::string_view kVolumeInterval = "Volume_Summary_";
 constexpr std::size_t kBufferBytes = 64 * 1024;
-// Far more than any message of the service has.
+// Far deeper than any message of the service.
 constexpr std::size_t kLongestMessage = 64 * 1024 * 1024;
 constexpr std::size_t kDeepestNesting = 256;
 
@@ -70,8 +70,8 @@ bool parseTimeOfName(std::string_view text, SummaryName& name) {
   return true;
 }
 
-// Follows a summary's text: an array of objects that have one entry each, whose value is an object.
-// The text of a message is written anew, on one line, as it is read.
+// Parses a summary: an array of objects with one entry each, whose value is an object. Writes each
+// message to one line while it reads it.
 class SummaryHandler {
  public:
   SummaryHandler(const SummaryMessageHandler& onMessage, SummaryTotals& totals)
@@ -114,12 +114,12 @@ class SummaryHandler {
   bool StartArray() {
     ++depth_;
     if (depth_ == 1) return true;
-    if (depth_ <= kInMessage) return fail("a message is no object");
+    if (depth_ <= kInMessage) return fail("a message is not an object");
     if (depth_ > kDeepestNesting) return fail("a message is nested too deep");
     return writer_.StartArray();
   }
   bool EndArray(rapidjson::SizeType /*elements*/) { return --depth_ == 0 || writer_.EndArray(); }
-  // Numbers come as text.
+  // The parser delivers numbers as text, so that they keep their digits.
   bool Int(int) { return false; }
   bool Uint(unsigned) { return false; }
   bool Int64(std::int64_t) { return false; }
@@ -127,14 +127,14 @@ class SummaryHandler {
   bool Double(double) { return false; }
 
  private:
-  // How many arrays and objects are open in an entry, and in its message.
+  // The number of open arrays and objects when the parser is in an entry, and in its message.
   static constexpr std::size_t kInEntry = 2;
   static constexpr std::size_t kInMessage = 3;
 
   template <typename Write>
   bool value(Write write) {
     if (depth_ == 0) return fail("expected an array of messages");
-    if (depth_ < kInMessage) return fail("a message is no object");
+    if (depth_ < kInMessage) return fail("a message is not an object");
     return withinLimit() && write();
   }
 
@@ -189,7 +189,7 @@ struct CloseFile {
 };
 using File = std::unique_ptr<std::FILE, CloseFile>;
 
-// None, with the reason, for what cannot be read to an end, such as a directory or a pipe.
+// Opens a regular file. Fails for directories and pipes: reading those may never end.
 File openFile(const std::string& path, std::string& error) {
   struct stat status {};
   if (::stat(path.c_str(), &status) != 0) {
@@ -197,7 +197,7 @@ File openFile(const std::string& path, std::string& error) {
     return nullptr;
   }
   if (!S_ISREG(status.st_mode)) {
-    error = "is no file";
+    error = "is not a file";
     return nullptr;
   }
   File file(std::fopen(path.c_str(), "rbe"));
@@ -240,7 +240,7 @@ bool readSummary(const std::string& path, const SummaryMessageHandler& handler,
   }
   if (!result.IsError()) return true;
   std::ifstream text(path, std::ios::binary);
-  error = "is no summary: " +
+  error = "is not a summary: " +
           describeJsonError(text, result.Offset(), result.Code(), summary.problem());
   return false;
 }

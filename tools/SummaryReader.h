@@ -8,32 +8,34 @@
 
 namespace halvox::tools {
 
-// What the name of a session's summary file tells.
+// The parts of the name of a summary file.
 struct SummaryName {
-  std::string time;  // local at the service, such as "2023-11-14 22:13:20 +0000"
+  std::string time;  // in the time zone of the service, such as "2023-11-14 22:13:20 +0000"
   std::int64_t secondsSince1970 = 0;
   std::string application;
   std::string service;
 };
 
-// Takes "20231114-221320+0000-halvox-APPLICATION-SERVICE.json" apart; none when it is no such name.
-// An application may have hyphens in its name, a service has none.
+// Splits "20231114-221320+0000-halvox-APPLICATION-SERVICE.json". Returns nothing for another name.
+// The name of an application may have hyphens; that of a service has none.
 std::optional<SummaryName> parseSummaryName(std::string_view name);
 
-// What a summary comes to as a whole.
+// The totals of one summary.
 struct SummaryTotals {
   std::uint64_t messages = 0;
   std::uint64_t volumeIntervals = 0;
-  // From the first to the last message that has a time stamp; none without any.
+  // From the first to the last message with a time stamp; none if there is no time stamp.
   std::optional<double> seconds;
 };
 
-// Called for each message in its order: its identifier, and itself as a JSON object on one line.
+// Called for each message in order, with its identifier and the message as a JSON object on one
+// line.
 using SummaryMessageHandler =
     std::function<void(std::string_view identifier, std::string_view message)>;
 
-// Reads a summary in the memory of one message. False, with the reason, when it cannot be read or
-// is none; messages before the place that is wrong were handed over then.
+// Reads a summary; holds at most one message in memory. Returns false with the reason in `error` if
+// the file cannot be read or is not a summary. The messages before the error were passed to
+// `handler`.
 bool readSummary(const std::string& path, const SummaryMessageHandler& handler,
                  SummaryTotals& totals, std::string& error);
 

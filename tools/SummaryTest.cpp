@@ -136,7 +136,7 @@ TEST_F(SummaryTest, BrokenFileIsToldAndTheOthersAreShown) {
 
   EXPECT_THAT(out_.str(), HasSubstr("org.example-player"));
   EXPECT_THAT(errors_.str(),
-              StartsWith("halvoxctl summary: " + broken + ": is no summary: line 1, column "));
+              StartsWith("halvoxctl summary: " + broken + ": is not a summary: line 1, column "));
 }
 
 TEST_F(SummaryTest, MissingFilesAndDirectoriesAreErrors) {
@@ -144,18 +144,18 @@ TEST_F(SummaryTest, MissingFilesAndDirectoriesAreErrors) {
   EXPECT_THAT(errors_.str(), HasSubstr("missing: No such file or directory"));
 
   EXPECT_EQ(show({scratch_.string()}), ExitStatus::kBadArguments);
-  EXPECT_THAT(errors_.str(), HasSubstr("is no file"));
+  EXPECT_THAT(errors_.str(), HasSubstr("is not a file"));
 }
 
 TEST_F(SummaryTest, WhatIsNoSummaryIsSaid) {
   EXPECT_THAT(problemOf(""), HasSubstr("empty"));
   EXPECT_THAT(problemOf("{}"), HasSubstr("expected an array of messages"));
   EXPECT_THAT(problemOf("7"), HasSubstr("expected an array of messages"));
-  EXPECT_THAT(problemOf("[1]"), HasSubstr("a message is no object"));
-  EXPECT_THAT(problemOf("[[]]"), HasSubstr("a message is no object"));
+  EXPECT_THAT(problemOf("[1]"), HasSubstr("a message is not an object"));
+  EXPECT_THAT(problemOf("[[]]"), HasSubstr("a message is not an object"));
   EXPECT_THAT(problemOf("[{}]"), HasSubstr("an entry has no message"));
-  EXPECT_THAT(problemOf(R"([{"A": 1}])"), HasSubstr("a message is no object"));
-  EXPECT_THAT(problemOf(R"([{"A": []}])"), HasSubstr("a message is no object"));
+  EXPECT_THAT(problemOf(R"([{"A": 1}])"), HasSubstr("a message is not an object"));
+  EXPECT_THAT(problemOf(R"([{"A": []}])"), HasSubstr("a message is not an object"));
   EXPECT_THAT(problemOf(R"([{"A": {}, "B": {}}])"), HasSubstr("more than one message"));
   EXPECT_THAT(problemOf("[{\"A\": {\"b\": \"\xFF\"}}]"), HasSubstr("encoding"));
   EXPECT_THAT(problemOf("[] x"), HasSubstr("line 1, column 4: "));

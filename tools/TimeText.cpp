@@ -25,7 +25,7 @@ std::optional<double> parseReal(std::string_view text) {
   return number;
 }
 
-// Takes a text apart from its beginning.
+// Reads a text from its beginning.
 class TextCursor {
  public:
   explicit TextCursor(std::string_view text) : rest_(text) {}
@@ -38,7 +38,7 @@ class TextCursor {
     rest_.remove_prefix(1);
     return true;
   }
-  // A number of exactly that many digits.
+  // Reads a number of exactly that many digits.
   bool takeNumber(std::size_t digits, int& number) {
     if (rest_.size() < digits) return false;
     number = 0;
@@ -49,7 +49,7 @@ class TextCursor {
     rest_.remove_prefix(digits);
     return true;
   }
-  // Digits behind a decimal point, at least one.
+  // Reads the digits after a decimal point, at least one.
   bool takeFraction(double& fraction) {
     std::string text = "0.";
     while (isAtDigit()) {
@@ -68,7 +68,7 @@ class TextCursor {
   std::string_view rest_;
 };
 
-// What stands in a calendar time; no offset: local time.
+// The parts of a calendar time. Without an offset it is local time.
 struct CalendarTime {
   std::tm fields{};
   double fraction = 0;
@@ -104,7 +104,7 @@ bool takeTimeOfDay(TextCursor& text, CalendarTime& time) {
          isWithin(fields.tm_sec, 0, 60);
 }
 
-// Nothing, or with or without a blank before it "Z", "+01:00", "+0100" or "+01".
+// Nothing, or "Z", "+01:00", "+0100" or "+01", with or without a blank before it.
 bool takeZone(TextCursor& text, std::optional<int>& offset) {
   if (text.isAtEnd()) return true;
   text.take(' ');
@@ -138,7 +138,7 @@ std::optional<double> parseCalendarTime(std::string_view text) {
   return static_cast<double>(seconds) + time.fraction;
 }
 
-// The seconds in "5min" or "-5min".
+// Returns the seconds of "5min" or "-5min".
 std::optional<double> parseAge(std::string_view text) {
   struct Unit {
     std::string_view name;
@@ -163,7 +163,7 @@ std::optional<double> parseAge(std::string_view text) {
   return std::nullopt;
 }
 
-// The midnight that began the day of `now` or one before it.
+// Returns the midnight at which the day of `now`, or an earlier day, began.
 double midnight(double now, int daysBefore) {
   const auto seconds = static_cast<std::time_t>(std::floor(now));
   std::tm fields{};
@@ -185,10 +185,11 @@ Parsed<double> parseTime(std::string_view text, double now) {
   }
   if (const auto age = parseAge(text)) return now - *age;
   if (const auto time = parseCalendarTime(text)) return *time;
-  return ArgumentError{"\"" + std::string(text) +
-                       "\" is not a time; expected one such as \"2026-11-21 22:44\", "
-                       "2026-11-21T22:44:05+01:00, today, yesterday, 5min or 2h (so long ago), or "
-                       "@1795313222 (seconds since 1970)"};
+  return ArgumentError{
+      "\"" + std::string(text) +
+      "\" is not a time; expected one such as \"2026-11-21 22:44\", "
+      "2026-11-21T22:44:05+01:00, today, yesterday, 5min or 2h (that long ago), or "
+      "@1795313222 (seconds since 1970)"};
 }
 
 std::string localTime(double seconds) {

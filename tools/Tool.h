@@ -7,7 +7,8 @@
 
 namespace halvox::tools {
 
-// Runs halvoxctl with these arguments, its own name not among them.
+// Runs halvoxctl with these arguments, which do not include its own name. Throws nothing that a
+// user can cause.
 ExitStatus runTool(std::vector<std::string> arguments, const ToolStreams& streams);
 
 }  // namespace halvox::tools

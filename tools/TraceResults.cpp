@@ -18,7 +18,7 @@ namespace {
 
 using Writer = rapidjson::Writer<rapidjson::OStreamWrapper>;
 
-constexpr const char* kNoResults = "is no results file of a trace";
+constexpr const char* kNoResults = "is not a results file of a trace";
 constexpr double kNanosecondsPerMicrosecond = 1000;
 constexpr int kProcess = 1;
 
@@ -26,7 +26,7 @@ std::string textOf(const rapidjson::Value& value) {
   return {value.GetString(), value.GetStringLength()};
 }
 
-// Names a track; `track` 0 is the process itself.
+// Writes the name of a track; track 0 is the process itself.
 void writeName(Writer& json, int track, const std::string& name) {
   json.StartObject();
   json.Key("ph");

@@ -8,28 +8,28 @@
 
 namespace halvox::tools {
 
-// What a results file says. Values are nanoseconds.
+// The content of a results file. Values are in nanoseconds.
 struct TraceResults {
   std::string product{};
-  std::vector<std::pair<std::string, std::vector<double>>> values{};  // as they stand in the file
+  std::vector<std::pair<std::string, std::vector<double>>> values{};  // in the file's order
 };
 
-// What the values of one measurement come to.
+// Statistics of the values of one measurement, in nanoseconds.
 struct TraceStatistics {
   std::size_t count = 0;
   double minimum = 0;
-  double median = 0;        // of an even number the lower one of the middle
-  double percentile95 = 0;  // the least value that 95 of 100 do not exceed
+  double median = 0;        // of an even number of values, the lower of the two in the middle
+  double percentile95 = 0;  // the smallest value that at least 95 % of the values do not exceed
   double maximum = 0;
 };
 
-// The results, or what is wrong with the file.
+// Returns the results, or what is wrong with the file.
 std::variant<TraceResults, std::string> readTraceResults(const std::string& file);
 
-// There must be values.
+// `values` must not be empty.
 TraceStatistics statisticsOf(std::vector<double> values);
 
-// See exportTrace().
+// Writes the form that exportTrace() describes.
 void writeTraceEvents(const TraceResults& results, std::ostream& out);
 
 }  // namespace halvox::tools

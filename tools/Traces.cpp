@@ -37,12 +37,12 @@ namespace fs = std::filesystem;
 constexpr const char* kResultsFile =
     "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Traces/tracing_results.ssj";
 constexpr client::ServiceType kTestService = 11;
-// The codes that the service records.
+// The range of codes that the service records.
 constexpr std::uint32_t kFirstCode = 0x21040000;
 constexpr std::uint32_t kLastCode = 0x2104408A;
-// The stop is answered when the trace has been read back.
+// The service answers the stop after it has read the trace back.
 constexpr std::chrono::minutes kStopWithin{10};
-// The service gives a tracer that does not answer up after ten seconds.
+// The service ends a tracer that does not answer within ten seconds. Wait longer than that.
 constexpr std::chrono::seconds kRecordsWithin{15};
 constexpr std::chrono::milliseconds kLookEvery{5};
 
@@ -93,7 +93,7 @@ void printJson(const TraceResults& results, std::ostream& out) {
   }
 }
 
-// What a trace parameters file comes to.
+// The result of reading a trace parameters file.
 struct ParamsFindings {
   std::size_t intervals = 0;           // that can be measured
   std::vector<std::string> reasons{};  // why others are not: what the service logs, and more
@@ -117,7 +117,7 @@ std::string hexadecimal(std::uint32_t code) {
   return text.data();
 }
 
-// Reads the file as the service is going to.
+// Reads the file in the same way as the service.
 ParamsFindings checkParams(const std::string& file) {
   ParamsFindings found;
   ParamsListener listener(found.reasons);
@@ -142,7 +142,7 @@ ParamsFindings checkParams(const std::string& file) {
   return found;
 }
 
-// Which file it is and when it was written; a new file is another one.
+// Identifies a file and its last change; a replaced file has another identity.
 std::pair<ino_t, std::int64_t> identityOf(const fs::path& file) {
   struct stat status {};
   if (::stat(file.c_str(), &status) != 0) return {};
@@ -151,7 +151,7 @@ std::pair<ino_t, std::int64_t> identityOf(const fs::path& file) {
 
 using Names = std::set<std::string>;
 
-// The recordings of the service that run now. None when that cannot be seen from here.
+// Returns the running recordings of the service; none if this user may not see them.
 std::optional<Names> recordings(const fs::path& storage) {
   Names names;
   std::error_code error;
@@ -162,8 +162,8 @@ std::optional<Names> recordings(const fs::path& storage) {
   return names;
 }
 
-// Waits until there is a recording that was not there before, because the start is answered while
-// the tracer still gets ready. False when none begins.
+// Waits for a recording that was not there before: the service answers the start before the tracer
+// is ready. Returns false if none begins.
 bool recordsSoon(const fs::path& storage, const Names& before) {
   const auto deadline = std::chrono::steady_clock::now() + kRecordsWithin;
   while (std::chrono::steady_clock::now() < deadline) {
@@ -181,13 +181,13 @@ bool isTracingOn(const platform::linux_::Configuration& configuration) {
   return feature != domain->second.end() && feature->second;
 }
 
-// A session of the service that is traced from its start to its stop.
+// A session that the service traces from its start to its stop.
 class TracedSession {
  public:
   explicit TracedSession(std::unique_ptr<client::HalvoxConnection> connection)
       : connection_(std::move(connection)) {}
 
-  // Why it does not run; empty when it does.
+  // Returns why the session does not run; empty if it runs.
   std::string start(const std::string& params) {
     const Dictionary configuration{{"HVReportingTraceType", "ktrace"},
                                    {"HVReportingMeridelPlistFilePath", params}};
@@ -201,7 +201,7 @@ class TracedSession {
     return failure;
   }
 
-  // Returns when the results are written; why they may not be, or nothing.
+  // Returns after the results are written. Returns why they may be missing, or nothing.
   std::string stop() {
     const auto stopped = connection_->stopReportingSessionForID(id_);
     if (!stopped) return stopped.failure->message;
@@ -210,7 +210,7 @@ class TracedSession {
   }
 
  private:
-  // Sessions are of their client, so the number need only be none of its other ones.
+  // Each client has IDs of its own, and this client has no other session.
   const client::ReporterID id_ = ::getpid();
   const std::unique_ptr<client::HalvoxConnection> connection_;
 };
@@ -219,7 +219,7 @@ void print(const TraceResults& results, OutputForm form, std::ostream& out) {
   form == OutputForm::kJson ? printJson(results, out) : printTable(results, out);
 }
 
-// Prints what was measured with these parameters, or complains that nothing was.
+// Prints what was measured with these parameters, or reports that nothing was.
 ExitStatus showMeasured(const std::string& file, const std::string& params, OutputForm form,
                         std::ostream& out, const Complaint& complain) {
   const auto read = readTraceResults(file);
@@ -238,10 +238,10 @@ ExitStatus showMeasured(const std::string& file, const std::string& params, Outp
   return ExitStatus::kDone;
 }
 
-// What is wrong with how the program ran; empty when nothing is.
+// Returns why the program's run counts as failed; empty if it does not.
 std::string runProgram(const std::vector<std::string>& command) {
   using namespace platform::linux_;
-  // The program is our caller's: it gets its signals, such as those that nohup ignores.
+  // The program inherits the signal settings of our caller, such as those that nohup ignores.
   auto child =
       ChildProcess::start({.command = command, .signals = ChildProgram::Signals::kInherited});
   if (!child) return "cannot run " + command[0] + ": " + errnoText(child.error().code);
@@ -282,7 +282,8 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
     return complain(ExitStatus::kRefused, failure);
   }
   if (isTracingOn(configuration) && !recordsSoon(storage, earlier)) {
-    return complain(ExitStatus::kRefused, "the service does not record; its log says why");
+    return complain(ExitStatus::kRefused,
+                    "the service does not record; see its log for the reason");
   }
   const std::string ofProgram = runProgram(request.command);
   if (const std::string failure = session.stop(); !failure.empty()) {

@@ -20,21 +20,21 @@ struct ExportTrace {
   std::string to{};
 };
 
-// Has the service trace while a program runs, and prints what was measured. The service must be one
-// whose configuration this is and trace at all. Says what is wrong in the trace parameters file,
-// and does not run the program when nothing in the file can be measured. Fails when the program
-// does, when the service refuses, when it leaves no new results, and when nothing was measured.
+// Lets the service trace while a program runs, and prints what was measured. The service must use
+// the configuration that this program finds, and tracing must be enabled in it. Reports errors in
+// the trace parameters file, and does not run the program if nothing in the file can be measured.
+// Fails if the program fails, the service refuses, there are no new results, or nothing was
+// measured.
 ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options, std::ostream& out,
                        std::ostream& errors);
 
-// Prints for each measurement of a results file how many values it has and which; as JSON, one
-// object a line.
+// Prints statistics of each measurement in a results file; as JSON, one object on each line.
 ExitStatus showTrace(const ShowTrace& request, OutputForm form, std::ostream& out,
                      std::ostream& errors);
 
-// Writes the intervals of a results file in the Trace Event form: a track for each measurement, on
-// which its intervals stand one behind the other, because results tell how long they took but not
-// when they were.
+// Writes the intervals of a results file as Trace Event JSON. Each measurement has a track, on
+// which its intervals follow each other: results hold how long intervals took, but not when they
+// began.
 ExitStatus exportTrace(const ExportTrace& request, OutputForm form, std::ostream& out,
                        std::ostream& errors);
 

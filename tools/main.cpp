@@ -8,7 +8,7 @@
 #include "tools/Tool.h"
 
 int main(int argc, char** argv) {
-  // Whoever started us may have chosen to ignore it; a reader that has gone ends us quietly.
+  // End quietly when the reader of the output is gone, even if our parent made us ignore SIGPIPE.
   std::signal(SIGPIPE, SIG_DFL);
   std::ios::sync_with_stdio(false);
   return static_cast<int>(halvox::tools::runTool(

@@ -2,12 +2,12 @@
 
 #include "tools/CommandSet.h"
 
-// The groups of commands. A group owns the names, options and help of its commands and says which
-// function carries each of them out; the table in tools/CommandLine.cpp puts the groups together.
+// The groups of commands. A group defines the names, options and help of its commands, and the
+// function that carries each of them out. The table in tools/CommandLine.cpp lists the groups.
 namespace halvox::tools {
 
-void addRequestCommands(CommandSet& commands);   // create, send, list…: a request each
-void addScriptRequests(CommandSet& commands);    // wait, sleep: in scripts only
+void addRequestCommands(CommandSet& commands);   // create, send, list…: one request each
+void addScriptRequests(CommandSet& commands);    // wait, sleep: only in scripts
 void addScriptCommands(CommandSet& commands);    // run, shell
 void addRecordCommands(CommandSet& commands);    // events, metrics, power, link
 void addSnapshotCommands(CommandSet& commands);  // snapshots

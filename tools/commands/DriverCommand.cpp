@@ -20,7 +20,7 @@ void addDriverCommand(CommandSet& commands) {
       [request](std::optional<std::chrono::milliseconds> interval) {
         request->watch = interval.value_or(std::chrono::seconds(1));
       },
-      "Keep showing by how much they change per second (default: every second)");
+      "Keep showing the changes per second, every SECONDS (default: 1)");
   commands.onRun(
       drivers, [request] { return *request; },
       [](const ShowDrivers& asked, const CommonOptions& options, const ToolStreams& streams) {

@@ -29,7 +29,7 @@ void addNumbers(CLI::App& app, const char* name, std::vector<std::int64_t>& numb
   addEach(app, name, numbers, parseNumber, description)->type_name("N");
 }
 
-// A command that shows the records of one kind; `request` is what its options are read into.
+// Adds a command that shows the records of one kind. Its options are parsed into `request`.
 CLI::App& addRecords(CommandSet& commands, const CommandText& text,
                      const std::shared_ptr<ShowRecords>& request) {
   CLI::App& app = commands.add(text);

@@ -14,7 +14,7 @@ constexpr const char* kSessionNote =
     "connection. Use 'halvoxctl run' or 'halvoxctl shell' for commands that belong "
     "together.";
 
-// What single arguments come to, for the request that is then made of them.
+// The parsed arguments, from which the request is then made.
 struct Arguments {
   ReporterID id = 0;
   ServiceType serviceType = 0;
@@ -34,7 +34,7 @@ ExitStatus runRequest(const Request& request, const CommonOptions& options,
   return runner.run(request, options.json, "halvoxctl ");
 }
 
-// `make` gives the request that `arguments` come to.
+// `make` returns the request for `arguments`.
 template <typename Make>
 void onRequest(CommandSet& commands, CLI::App& app, const SharedArguments& arguments, Make make) {
   commands.onRun(
@@ -57,7 +57,7 @@ void addJson(CommandSet& commands, CLI::App& app, const SharedArguments& argumen
       ->required();
 }
 
-// A request that has a session's reporter ID and nothing else.
+// Adds a request with a session's reporter ID as its only argument.
 template <typename R>
 void addForSession(CommandSet& commands, const CommandText& text) {
   const auto arguments = std::make_shared<Arguments>();
@@ -104,8 +104,8 @@ void addStart(CommandSet& commands) {
         arguments->isWaiting = true;
         arguments->time = time;
       },
-      "Wait for the service's answer, which it holds back until the session is stopped; without a "
-      "number, as long as --timeout says");
+      "Wait for the service's answer, which comes when the session is stopped; at most SECONDS, or "
+      "--timeout if there is no number");
   onRequest(commands, app, arguments, [&commands](const Arguments& given) {
     if (!given.isWaiting) return Start{given.id, std::nullopt};
     return Start{given.id, given.time.value_or(commands.options().timeout)};
@@ -116,7 +116,7 @@ Send makeSend(const Arguments& given) {
   if (given.isToAll == !given.ids.empty()) {
     throw CLI::ValidationError(
         "--id", given.isToAll
-                    ? "goes with no --all; expected one of the two"
+                    ? "cannot be combined with --all; expected one of the two"
                     : "is missing; expected --id ID for some sessions or --all for the active");
   }
   Send send{
@@ -146,7 +146,7 @@ void addSend(CommandSet& commands) {
   onRequest(commands, app, arguments, makeSend);
 }
 
-// A request that has no arguments.
+// Adds a request without arguments.
 template <typename R>
 void addBare(CommandSet& commands, const CommandText& text) {
   onRequest(commands, commands.add(text), std::make_shared<Arguments>(),
@@ -181,7 +181,7 @@ void addRequestCommands(CommandSet& commands) {
                            .example = "halvoxctl list --json"});
   addBare<Kill>(commands,
                 {.name = "kill",
-                 .summary = "End the service at once, without cleanup; for root and its user",
+                 .summary = "End the service at once, without cleanup; only root and its user may",
                  .example = "halvoxctl kill"});
 }
 
@@ -197,9 +197,8 @@ void addScriptRequests(CommandSet& commands) {
     return WaitForStart{given.id, given.time.value_or(std::chrono::milliseconds::zero())};
   });
 
-  CLI::App& sleep = commands.add({.name = "sleep",
-                                  .summary = "Let time pass with the connection open",
-                                  .example = "sleep 0.5"});
+  CLI::App& sleep = commands.add(
+      {.name = "sleep", .summary = "Wait with the connection open", .example = "sleep 0.5"});
   addParsed(sleep, "SECONDS", arguments->time, parseSeconds, "How long")->required();
   onRequest(commands, sleep, arguments, [](const Arguments& given) { return Sleep{*given.time}; });
 }

@@ -45,11 +45,11 @@ ExitStatus runTypedLines(const RunShell& /*shell*/, const CommonOptions& options
 
 void addScriptCommands(CommandSet& commands) {
   const auto script = std::make_shared<RunScript>();
-  CLI::App& run =
-      commands.add({.name = "run",
-                    .summary = "Carry out a file of commands, one a line, over one connection",
-                    .example = "printf 'create 7\\nstart 7\\nstop 7\\n' | halvoxctl run -",
-                    .details = kScriptNote});
+  CLI::App& run = commands.add(
+      {.name = "run",
+       .summary = "Carry out the commands in a file, one on each line, over one connection",
+       .example = "printf 'create 7\\nstart 7\\nstop 7\\n' | halvoxctl run -",
+       .details = kScriptNote});
   run.add_option("FILE", script->file, "The file; \"-\" reads standard input")->required();
   run.add_flag("--keep-going", script->keepGoing, "Continue after lines that fail");
   commands.onRun(

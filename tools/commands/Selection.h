@@ -6,9 +6,11 @@
 
 namespace halvox::tools {
 
-// The options that all commands that show stored records have: --since, --until, --last, --follow,
-// --database, and with `names`, the name of an option, one for the names of the records. `records`
-// is what the help calls them. They are read into `selection`, which must live as long as `app`.
+// Adds the options that all commands for stored records share: --since, --until, --last, --follow
+// and
+// --database. If `names` is not null, it is the name of an option for the names of the records.
+// `records` is the word for the records in the help. The options are parsed into `selection`, which
+// must live as long as `app`.
 void addSelection(CLI::App& app, RecordSelection& selection, const char* records,
                   const char* names);
 

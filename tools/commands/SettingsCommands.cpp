@@ -22,7 +22,7 @@ Preferences checked(const Preferences& request) {
   }
   if ((request.action == Action::kSet) != request.value.has_value()) {
     throw CLI::ValidationError("VALUE", request.value.has_value()
-                                            ? "goes with set only"
+                                            ? "is only for set"
                                             : "is missing; expected what to set the key to");
   }
   return request;
@@ -34,10 +34,9 @@ void addPreferences(CommandSet& commands) {
       {.name = "preferences",
        .summary = "Show or change settings that the service follows while it runs",
        .example = "halvoxctl preferences set com.tarno.halvox device_name Kitchen",
-       .details =
-           "A set or unset leaves everything else in the file as it is, comments too. "
-           "Tables with lines of their own cannot be changed this way; edit the file instead.\nPut "
-           "-- before a VALUE that begins with -.",
+       .details = "set and unset leave everything else in the file as it is, including comments. "
+                  "They cannot change tables with lines of their own; edit the file for that.\nPut "
+                  "-- before a VALUE that begins with -.",
        .reach = CommandReach::kFiles});
   addParsed(preferences, "ACTION", request->action, parseAction, "get, set or unset")->required();
   preferences.add_option("DOMAIN", request->domain, "A domain, such as com.tarno.halvox")
@@ -45,7 +44,7 @@ void addPreferences(CommandSet& commands) {
   preferences.add_option("KEY", request->key, "A key; without one, get shows all keys");
   preferences.add_option("VALUE", request->value,
                          "A TOML value; anything else is taken as a string");
-  preferences.add_flag("--string", request->isString, "Take VALUE as a string in any case");
+  preferences.add_flag("--string", request->isString, "Always take VALUE as a string");
   preferences.add_option("--user", request->user, "Whose settings (default: mobile)")
       ->type_name("USER");
   preferences

@@ -9,7 +9,7 @@ namespace halvox::tools {
 namespace {
 
 void addFile(CLI::App& app, std::string& file) {
-  app.add_option("FILE", file, "The archive; \"newest\" is the newest of the service's")
+  app.add_option("FILE", file, "The archive; \"newest\" stands for the newest one of the service")
       ->required();
 }
 
@@ -37,10 +37,11 @@ void addExtract(CommandSet& commands, CLI::App& snapshots) {
                   .reach = CommandReach::kFiles});
   addFile(extract, request->file);
   extract
-      .add_option("--to", request->directory,
-                  "Where to; made when it is missing (default: a directory named as the archive)")
+      .add_option(
+          "--to", request->directory,
+          "Where to; created if it is missing (default: a directory named like the archive)")
       ->type_name("DIRECTORY");
-  extract.add_flag("--force", request->force, "Replace files that are there");
+  extract.add_flag("--force", request->force, "Replace existing files");
   commands.onRun(
       extract, [request] { return *request; },
       [](const ExtractSnapshot& asked, const CommonOptions& options, const ToolStreams& streams) {
@@ -60,7 +61,7 @@ void addSnapshotCommands(CommandSet& commands) {
                     .reach = CommandReach::kFiles});
   snapshots.require_subcommand(0, 1);
   addSelection(snapshots, list->selection, "snapshots", nullptr);
-  // Of itself it lists.
+  // Without a sub-command it lists.
   commands.onRun(
       snapshots, [list] { return *list; },
       [](const ShowRecords& asked, const CommonOptions& options, const ToolStreams& streams) {

@@ -61,7 +61,7 @@ void addExport(CommandSet& commands, CLI::App& trace) {
 void addTraceCommands(CommandSet& commands) {
   CLI::App& trace =
       commands.add({.name = "trace",
-                    .summary = "Have the service trace a program, or show its results",
+                    .summary = "Let the service trace a program, or show its results",
                     .example = "halvoxctl trace record --params params.plist -- pw-play tone.wav"});
   trace.require_subcommand(1);
   addRecord(commands, trace);
