@@ -123,7 +123,7 @@ TEST(CommandLineTest, EventsTakeFilters) {
   EXPECT_EQ(events.database, "d");
 }
 
-// What a command other than a request comes to.
+// The parsed form of a command that is not a request.
 template <typename T>
 T runOf(const Words& words) {
   const auto parsed = parse(words);

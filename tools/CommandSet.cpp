@@ -24,7 +24,7 @@ CLI::App& CommandSet::addBelow(CLI::App& parent, const CommandText& text) {
 }
 
 void CommandSet::addCommonOptions(CLI::App& app, CommandReach reach) {
-  app.add_flag("--json", options_.json, "Print JSON, one object a line");
+  app.add_flag("--json", options_.json, "Print JSON, one object on each line");
   if (source_ == CommandSource::kScriptLine) return;
   auto* socket = app.add_option("--socket", options_.socket,
                                 "The service's socket (default: $HALVOX_SOCKET, else what the "

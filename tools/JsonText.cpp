@@ -68,14 +68,14 @@ class Converter {
   bool convert(const rapidjson::Value& json, Value& value) {
     switch (json.GetType()) {
       case rapidjson::kNullType:
-        return fail("null has no form in a message; leave the key out");
+        return fail("a message cannot hold null; omit the key");
       case rapidjson::kFalseType:
       case rapidjson::kTrueType:
         value = json.GetBool();
         return true;
       case rapidjson::kStringType:
         if (textOf(json).find('\0') != std::string_view::npos) {
-          return fail("a NUL character has no form in a message");
+          return fail("a message cannot hold a NUL character");
         }
         value = textOf(json);
         return true;

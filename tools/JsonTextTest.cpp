@@ -56,7 +56,7 @@ TEST(JsonTextTest, WholeNumbersKeepTheir64Bits) {
 
 TEST(JsonTextTest, RefusesNullAndNamesItsPlace) {
   EXPECT_EQ(errorOf(R"({"a": {"b": [1, null]}})"),
-            "\"a.b[1]\": null has no form in a message; leave the key out");
+            "\"a.b[1]\": a message cannot hold null; omit the key");
 }
 
 TEST(JsonTextTest, RefusesAKeyThatOccursTwice) {
@@ -77,7 +77,7 @@ TEST(JsonTextTest, RefusesAnythingButAnObject) {
 }
 
 TEST(JsonTextTest, RefusesANulInAText) {
-  EXPECT_EQ(errorOf(R"({"a": "x\u0000y"})"), "\"a\": a NUL character has no form in a message");
+  EXPECT_EQ(errorOf(R"({"a": "x\u0000y"})"), "\"a\": a message cannot hold a NUL character");
 }
 
 TEST(JsonTextTest, NestsAsDeepAsAMessageMay) {

@@ -121,16 +121,16 @@ class ParsedText {
   // The offset for a new top-level key: after the last one, else before the first table. After a
   // table header it would belong to that table.
   [[nodiscard]] std::size_t placeForNewKey() const {
-    std::size_t behind = 0;
+    std::size_t afterKeys = 0;
     std::size_t firstTable = text_.size();
     for (const auto& [key, node] : root()) {
       if (standsBehindItsKey(node)) {
-        behind = std::max(behind, lineEnd(text_, end(node)));
+        afterKeys = std::max(afterKeys, lineEnd(text_, end(node)));
       } else {
         firstTable = std::min(firstTable, lineStart(text_, offsetOf(text_, key.source().begin)));
       }
     }
-    return behind > 0 ? behind : firstTable;
+    return afterKeys > 0 ? afterKeys : firstTable;
   }
 
  private:

@@ -28,7 +28,7 @@ using ::testing::Not;
 
 constexpr std::uint32_t kIssueMetric = 0x5B0003;
 
-// The issue metric's fields and one that nobody knows.
+// The fields of the issue metric and an unknown one.
 class Issue final : public platform::ProtoBase {
  public:
   bool readFrom(platform::ProtoReader& /*reader*/) override { return true; }

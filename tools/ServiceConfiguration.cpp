@@ -26,7 +26,7 @@ bool isSocketInTheEnvironment() {
 
 // The first of the usual places that holds a store.
 struct StoreSearch {
-  std::filesystem::path directory;  // the user's when there is no store
+  std::filesystem::path directory;  // the user's if there is no store
   bool isThere = false;
   std::vector<client::TriedPlace> tried{};  // without success
 };
