@@ -29,6 +29,7 @@
 #include "bench/load/Server.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/link/nats/NatsHandles.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::bench {
 namespace {
@@ -100,8 +101,8 @@ class JetStream {
  public:
   JetStream()
       : port_(std::to_string(freePort())),
-        process_({"nats-server", "-js", "-sd", directory_.path(), "-a", "127.0.0.1", "-p", port_,
-                  "-l", directory_.path() + "/log"},
+        process_({"nats-server", "-js", "-sd", directory_.path().string(), "-a", "127.0.0.1", "-p",
+                  port_, "-l", directory_.path("log")},
                  {}) {
     waitUntil("nats-server", [this] {
       return natsConnection_ConnectTo(connection_.out(), url().c_str()) == NATS_OK;

@@ -39,17 +39,4 @@ class Process {
   platform::linux_::ChildProcess child_;
 };
 
-// A temporary directory. The destructor deletes it with its content.
-class ScratchDirectory {
- public:
-  ScratchDirectory();
-  ~ScratchDirectory();
-  ScratchDirectory(const ScratchDirectory&) = delete;
-  ScratchDirectory& operator=(const ScratchDirectory&) = delete;
-  [[nodiscard]] const std::string& path() const { return path_; }
-
- private:
-  std::string path_;
-};
-
 }  // namespace halvox::bench

@@ -6,7 +6,7 @@
 namespace halvox::bench {
 
 Server::Server(const ServerPrograms& programs, ServerKind kind, const std::string& settings)
-    : kind_(kind), socket_(directory_.path() + "/s"), process_(start(programs, settings)) {
+    : kind_(kind), socket_(directory_.path("s")), process_(start(programs, settings)) {
   process_->waitForSocket(socket_);
 }
 
@@ -24,9 +24,9 @@ std::unique_ptr<Process> Server::start(const ServerPrograms& programs,
     return std::make_unique<Process>(std::vector<std::string>{programs.echo, "--echo", socket_},
                                      std::vector<std::string>{});
   }
-  const std::string config = directory_.path() + "/halvox.toml";
+  const std::string config = directory_.path("halvox.toml");
   std::ofstream(config) << "[listener]\nsocket = \"" << socket_ << "\"\n[storage]\ndirectory = \""
-                        << directory_.path() << "/state\"\nmax_megabytes = 8192\n"
+                        << directory_.path("state") << "\"\nmax_megabytes = 8192\n"
                         << "[analytics]\nwanted = ["
                         << (kind_ == ServerKind::kStored ? "\"*\"" : "")
                         << "]\n[limits]\nclient_history_megabytes = 65536\n"

@@ -6,6 +6,7 @@
 
 #include "bench/load/LoadClient.h"
 #include "bench/load/Process.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::bench {
 
@@ -31,14 +32,14 @@ class Server {
   [[nodiscard]] std::unique_ptr<LoadClient> client(std::int64_t reporter) const;
   [[nodiscard]] std::unique_ptr<LoadClient> idleClient() const;
   [[nodiscard]] const Process& process() const { return *process_; }
-  [[nodiscard]] std::string database() const { return directory_.path() + "/state/halvox.db"; }
+  [[nodiscard]] std::string database() const { return directory_.path("state/halvox.db"); }
 
  private:
   [[nodiscard]] std::unique_ptr<Process> start(const ServerPrograms& programs,
                                                const std::string& settings) const;
 
   ServerKind kind_;
-  ScratchDirectory directory_;
+  platform::linux_::ScratchDirectory directory_;
   std::string socket_;
   std::unique_ptr<Process> process_;
 };

@@ -7,7 +7,6 @@
 #include <fstream>
 #include <numbers>
 #include <stdexcept>
-#include <system_error>
 
 #include <unistd.h>
 
@@ -88,23 +87,15 @@ std::string PrivatePipeWire::missingTools() {
 }
 
 PrivatePipeWire::PrivatePipeWire() {
-  std::string name = std::filesystem::temp_directory_path() / "halvox-audio.XXXXXX";
-  if (mkdtemp(name.data()) == nullptr) {
-    throw std::system_error(errno, std::generic_category(), "mkdtemp");
-  }
-  directory_ = name;
   server_ = std::make_unique<PipedProcess>(
-      std::vector<std::string>{HALVOX_PRIVATE_PIPEWIRE, "serve", directory_});
+      std::vector<std::string>{HALVOX_PRIVATE_PIPEWIRE, "serve", directory()});
   ready_ = server_->readLine() == "ready";
   if (ready_) {
     enterEnvironment();
   }
 }
 
-PrivatePipeWire::~PrivatePipeWire() {
-  server_.reset();
-  std::filesystem::remove_all(directory_);
-}
+PrivatePipeWire::~PrivatePipeWire() = default;
 
 bool PrivatePipeWire::restart() const {
   server_->writeLine("restart");
@@ -120,13 +111,13 @@ std::string PrivatePipeWire::makeTone(double seconds) const {
     const double phase = 2 * std::numbers::pi * kFrequency * i / kRate;
     append(samples, static_cast<std::uint16_t>(std::lround(kAmplitude * std::sin(phase))));
   }
-  std::string path = directory_ / "tone.wav";
+  std::string path = scratch_.path("tone.wav");
   std::ofstream(path, std::ios::binary) << makeWave(samples);
   return path;
 }
 
 void PrivatePipeWire::enterEnvironment() const {
-  std::ifstream file(directory_ / "environment");
+  std::ifstream file(scratch_.path("environment"));
   for (std::string line; std::getline(file, line);) {
     const auto equals = line.find('=');
     setenv(line.substr(0, equals).c_str(), line.substr(equals + 1).c_str(), 1);

@@ -7,6 +7,7 @@
 #include <vector>
 
 #include "platform/linux/base/ChildProcess.h"
+#include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::pipewire_testing {
 
@@ -50,12 +51,12 @@ class PrivatePipeWire {
   [[nodiscard]] bool restart() const;
   // Writes a WAV file with a tone and returns its path.
   [[nodiscard]] std::string makeTone(double seconds) const;
-  [[nodiscard]] const std::filesystem::path& directory() const { return directory_; }
+  [[nodiscard]] const std::filesystem::path& directory() const { return scratch_.path(); }
 
  private:
   void enterEnvironment() const;
 
-  std::filesystem::path directory_;
+  const platform::linux_::ScratchDirectory scratch_;  // outlives the server
   std::unique_ptr<PipedProcess> server_;
   bool ready_ = false;
 };
