@@ -41,10 +41,9 @@ class [[nodiscard]] Result {
   requires(std::is_convertible_v<Source, Value> &&
            !std::is_same_v<std::remove_cvref_t<Source>, Result> &&
            !std::is_same_v<std::remove_cvref_t<Source>, Error>)
-      Result(Source&& value)  // NOLINT(google-explicit-constructor)
+      Result(Source&& value)  // NOLINT(bugprone-forwarding-reference-overload): constrained above
       : state_(std::in_place_index<0>, std::forward<Source>(value)) {}
-  Result(Error error)  // NOLINT(google-explicit-constructor)
-      : state_(std::in_place_index<1>, std::move(error)) {}
+  Result(Error error) : state_(std::in_place_index<1>, std::move(error)) {}
 
   [[nodiscard]] bool has_value() const noexcept { return state_.index() == 0; }
   explicit operator bool() const noexcept { return has_value(); }
@@ -70,7 +69,7 @@ class [[nodiscard]] Result<void, Code> {
   using Error = Failure<Code>;
 
   Result() = default;
-  Result(Error error) : error_(std::move(error)) {}  // NOLINT(google-explicit-constructor)
+  Result(Error error) : error_(std::move(error)) {}
 
   [[nodiscard]] bool has_value() const noexcept { return !error_.has_value(); }
   explicit operator bool() const noexcept { return has_value(); }
