@@ -80,6 +80,35 @@ function(halvox_program name)
   halvox_tidy(${name})
 endfunction()
 
+# halvox_module(<file> SOURCES <files> [PARTS <targets>] [DEPENDS <targets>])
+# A library of that file name which the programs load when they need it, beside them in the build and
+# in the library directory when installed. It holds its sources and the objects of PARTS. What these
+# use of our other libraries is not linked again but found in the program, so that nothing that must
+# exist once in a process, such as the installed services, is there twice.
+function(halvox_module file)
+  cmake_parse_arguments(ARG "" "" "SOURCES;PARTS;DEPENDS" ${ARGN})
+  list(TRANSFORM ARG_PARTS REPLACE "(.+)" "$<TARGET_OBJECTS:\\1>" OUTPUT_VARIABLE objects)
+  add_library(${file} MODULE
+    ${ARG_SOURCES} ${CMAKE_SOURCE_DIR}/platform/linux/modules/ModuleVersion.c ${objects})
+  target_link_libraries(${file} PRIVATE ${ARG_DEPENDS} halvox_flags)
+  target_compile_definitions(${file} PRIVATE HALVOX_VERSION="${PROJECT_VERSION}")
+  set_target_properties(${file} PROPERTIES
+    PREFIX "" LIBRARY_OUTPUT_DIRECTORY ${CMAKE_RUNTIME_OUTPUT_DIRECTORY})
+  install(TARGETS ${file} LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}/halvox)
+endfunction()
+
+# halvox_loads_modules(<program>)
+# Gives modules what they use of our libraries: links the whole of these libraries, also what the
+# program itself does not use, and exports our own names, which are a small part of all names.
+function(halvox_loads_modules program)
+  target_link_options(${program} PRIVATE
+    -Wl,--dynamic-list=${CMAKE_SOURCE_DIR}/platform/linux/modules/exported-names.txt)
+  set_target_properties(${program} PROPERTIES
+    LINK_DEPENDS ${CMAKE_SOURCE_DIR}/platform/linux/modules/exported-names.txt
+    LINK_LIBRARY_OVERRIDE
+      "WHOLE_ARCHIVE,halvox_platform,halvox_base,halvox_store,halvox_drivers")
+endfunction()
+
 # The tests that ThreadSanitizer runs too.
 add_custom_target(halvox_concurrent_tests)
 

@@ -42,17 +42,31 @@ SnapshotOptions snapshotOptions(const Configuration& configuration) {
 }
 
 std::unique_ptr<KdebugService> makeKdebug(std::string& failure) {
-  const std::filesystem::path module = LttngKdebugService::modulePath();
-  if (module.empty()) {
-    failure = "not in this build";
-    return std::make_unique<NoKdebugService>();
-  }
-  auto loaded = LttngKdebugService::load(module);
+  auto loaded = LttngKdebugService::load();
   if (auto* service = std::get_if<std::unique_ptr<KdebugService>>(&loaded)) {
     return std::move(*service);
   }
   failure = std::get<std::string>(loaded);
   return std::make_unique<NoKdebugService>();
+}
+
+TraceOptions traceOptions(const Configuration& configuration, FeatureFlagService& features) {
+  const bool isEnabled = features._os_feature_enabled_impl("Acoustat", "Tracing");
+  return {.storageDirectory = configuration.storage.directory,
+          .tracing = isEnabled ? Tracing::kEnabled : Tracing::kDisabled};
+}
+
+// Null when the link goes elsewhere, or when its module cannot be loaded.
+std::unique_ptr<NatsTlmReporting> makeNats(const Configuration::Link& options,
+                                           const NatsEnvironment& environment,
+                                           std::string& failure) {
+  if (options.backend != LinkBackend::kNats) return nullptr;
+  auto loaded = loadNatsTlmReporting(options, environment);
+  if (auto* link = std::get_if<std::unique_ptr<NatsTlmReporting>>(&loaded)) {
+    return std::move(*link);
+  }
+  failure = std::get<std::string>(loaded);
+  return nullptr;
 }
 
 }  // namespace
@@ -92,11 +106,9 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
       preferences(preferenceReader, statistics),
       ioReport(makeDriverSources(configuration.drivers), statistics),
       resultsFiles(configuration.storage.root, statistics),
-      traces(makeTraceServices(configuration.storage.directory, statistics)),
+      traces(makeTraceServices(traceOptions(configuration, featureFlags), statistics)),
       dispatch(*log, statistics),
-      nats(configuration.link.backend == LinkBackend::kNats
-               ? makeNatsTlmReporting(configuration.link, {dispatch, statistics})
-               : nullptr) {}
+      nats(makeNats(configuration.link, {dispatch, statistics}, natsFailure)) {}
 
 TLMReportingService& LinuxAdapters::realTimeLink() {
   if (nats) return *nats;

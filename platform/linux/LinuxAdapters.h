@@ -18,7 +18,7 @@
 #include "platform/linux/link/local/CallbackThread.h"
 #include "platform/linux/link/local/LocalTlmReportingService.h"
 #include "platform/linux/link/local/NoneTlmReportingService.h"
-#include "platform/linux/link/nats/NatsTlmReporting.h"
+#include "platform/linux/link/nats/NatsModule.h"
 #include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "platform/linux/runtime/LibcClockService.h"
@@ -81,6 +81,7 @@ struct LinuxAdapters {
   JsonResultsFileService resultsFiles;
   const std::unique_ptr<TraceServices> traces;
   AsioDispatchService dispatch;
+  std::string natsFailure;                       // empty unless the link is to go there and cannot
   const std::unique_ptr<NatsTlmReporting> nats;  // only when the link goes there
 };
 

@@ -7,6 +7,7 @@
 #include <sysexits.h>
 
 #include "platform/linux/LinuxAdapters.h"
+#include "platform/linux/drivers/ConfiguredSources.h"
 #include "platform/log.h"
 
 namespace halvox::platform::linux_ {
@@ -94,8 +95,8 @@ Services LinuxPlatform::services() {
 }
 
 std::optional<StartFailure> LinuxPlatform::open() {
-  if (adapters_->configuration.link.backend == LinkBackend::kNats && !adapters_->nats) {
-    return StartFailure{EX_CONFIG, "link.backend is \"nats\", which is not in this build"};
+  if (!adapters_->natsFailure.empty()) {
+    return StartFailure{EX_CONFIG, "link.backend = \"nats\" needs " + adapters_->natsFailure};
   }
   if (const auto error = adapters_->store.open()) {
     return startFailure(*error);
@@ -131,12 +132,14 @@ void LinuxPlatform::logStart() const {
   kLog.notice("serving ", adapters_->configuration.listener.socket.string(), ", bus ",
               busName(adapters_->configuration.listener.bus), ", store ",
               adapters_->configuration.storage.directory.string());
-  kLog.notice("link: ", linkName(adapters_->configuration.link.backend), ", in this build: local, ",
-              isNatsBuilt() ? "nats, " : "", "none");
-  kLog.notice("trace points: ", adapters_->kdebugFailure.empty()
-                                    ? "LTTng"
-                                    : "none, LTTng " + adapters_->kdebugFailure);
+  kLog.notice("link: ", linkName(adapters_->configuration.link.backend));
+  kLog.notice("trace points: ",
+              adapters_->kdebugFailure.empty() ? "LTTng" : "none, " + adapters_->kdebugFailure);
   kLog.notice("traces: ", adapters_->traces->description());
+  if (adapters_->configuration.drivers.alsa && !hasAlsaSource()) {
+    kLog.notice("drivers.alsa = true needs HALVOX_ALSA, which this build does not have; ALSA's ",
+                "counters are not reported");
+  }
 }
 
 }  // namespace halvox::platform::linux_

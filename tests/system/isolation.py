@@ -20,6 +20,7 @@ from pathlib import Path
 BIN = Path(os.environ.get("HALVOX_BIN", Path(__file__).parents[2] / "build/dev/bin")).resolve()
 # The programs of the build that these tests run, and the files that those need.
 PROGRAMS = ("halvox-reportingd", "halvoxctl", "halvox-tracer-keeper", "halvox-kdebug-lttng.so",
+            "halvox-tracing-lttng.so",
             "halvox_kdebug_probe", "halvox_trace_client")
 NOBODY = 65534
 ROOTS_DAEMON = Path("/run/lttng/client-lttng-sessiond")

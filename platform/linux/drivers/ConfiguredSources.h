@@ -9,8 +9,11 @@
 namespace halvox::platform::linux_ {
 
 // Makes the sources of driver counters that the configuration enables and this build contains. The
-// caller owns them. Nothing is read yet.
+// caller owns them. Nothing is read yet. The source of PipeWire loads its module by itself.
 [[nodiscard]] std::vector<std::unique_ptr<DriverSource>> makeDriverSources(
     const Configuration::Drivers& drivers);
+
+// Whether this build has the source of ALSA.
+[[nodiscard]] bool hasAlsaSource();
 
 }  // namespace halvox::platform::linux_

@@ -27,6 +27,9 @@ class DriverSource {
   // All channels that exist now, and their values. Never null; empty if there are none. What cannot
   // be read is skipped and logged by the source.
   [[nodiscard]] virtual std::shared_ptr<const Reading> read() = 0;
+  // A session has asked for the last reading as a sample; without this call it was only to find out
+  // which channels there are. Called after the reading was handed over: nobody waits for it.
+  virtual void sampled() {}
 };
 
 }  // namespace halvox::platform::linux_

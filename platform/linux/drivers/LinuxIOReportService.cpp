@@ -17,10 +17,11 @@ using Readings = std::vector<std::shared_ptr<const Reading>>;  // by source; nul
 
 // Asks all sources first and takes the readings afterwards, so that the wait is that of the slowest
 // source and not the sum.
-Readings read(const Readers& readers, std::chrono::milliseconds longestWait) {
+Readings read(const Readers& readers, std::chrono::milliseconds longestWait,
+              SourceReader::Use use) {
   std::vector<SourceReader::Asked> asked;
   asked.reserve(readers.size());
-  for (const auto& reader : readers) asked.push_back(reader->ask(longestWait));
+  for (const auto& reader : readers) asked.push_back(reader->ask(longestWait, use));
   Readings readings;
   readings.reserve(readers.size());
   for (std::size_t source = 0; source < readers.size(); ++source) {
@@ -103,7 +104,8 @@ class ReadMoment final : public IOReportMoment {
       : readers_(readers), longestWait_(longestWait) {}
 
   [[nodiscard]] const Readings& readings() {
-    if (!readings_.has_value()) readings_ = read(readers_, longestWait_);
+    if (!readings_.has_value())
+      readings_ = read(readers_, longestWait_, SourceReader::Use::kSample);
     return *readings_;
   }
 
@@ -139,7 +141,8 @@ IOReportService::Channels LinuxIOReportService::IOReportCopyChannelsInGroup(
     Name group, Name subGroup, std::optional<IOReportError>& /*error*/) {
   // A channel that is missed here is missed until the service restarts, so this may take longer
   // than the samples of a moment.
-  const Readings readings = read(readers_, std::max(longestWait_, SourceReader::kLongestOpening));
+  const Readings readings = read(readers_, std::max(longestWait_, SourceReader::kLongestOpening),
+                                 SourceReader::Use::kFindChannels);
   GroupName names{std::optional<std::string>(group), std::optional<std::string>(subGroup)};
   return std::make_shared<GroupChannels>(std::move(names), readings);
 }

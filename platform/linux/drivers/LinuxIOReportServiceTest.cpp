@@ -102,6 +102,22 @@ TEST_F(LinuxIOReportServiceTest, AGroupIsChosenByItsNamesAndAnAbsentNameMeansAny
   EXPECT_EQ(service.IOReportGetChannelCount(find("Tx", std::nullopt)), 0);
 }
 
+TEST_F(LinuxIOReportServiceTest, ASourceLearnsOfSamplesAndNotOfTheSearchForChannels) {
+  int samples = 0;
+  std::vector<std::unique_ptr<DriverSource>> sources;
+  sources.push_back(std::make_unique<MadeSource>(
+      [] { return makeReading({simpleChannel("Tx", "a")}, {1}); }, [&samples] { ++samples; }));
+  service_ = std::make_unique<LinuxIOReportService>(std::move(sources), platform_.statistics,
+                                                    longestWait_);
+  service_->open();
+
+  const auto channels = find("Tx", std::nullopt);
+  EXPECT_THAT(show(sample(channels)), SizeIs(1));
+  service_.reset();  // ends the thread of the source, after its last call
+
+  EXPECT_EQ(samples, 1);
+}
+
 // As in a report, which releases the samples of each group before it takes the next ones.
 TEST_F(LinuxIOReportServiceTest, AllGroupsOfAMomentShareOneReading) {
   std::atomic<int> readings{0};

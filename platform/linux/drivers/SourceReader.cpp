@@ -36,7 +36,7 @@ SourceReader::~SourceReader() {
 
 void SourceReader::startOpening() {
   thread_ = std::thread([this] { run(); });
-  opening_ = ask(kLongestOpening);
+  opening_ = ask(kLongestOpening, Use::kFindChannels);
 }
 
 void SourceReader::waitUntilOpen() {
@@ -46,8 +46,9 @@ void SourceReader::waitUntilOpen() {
              " ms; its counters are not reported until the service restarts");
 }
 
-SourceReader::Asked SourceReader::ask(std::chrono::milliseconds wait) {
+SourceReader::Asked SourceReader::ask(std::chrono::milliseconds wait, Use use) {
   const MutexLock lock(mutex_);
+  if (use == Use::kSample) isSampleWanted_ = true;
   const std::uint64_t number = want();
   received_.add();
   // A late source is read all the same, to find out whether it is in time again.
@@ -108,6 +109,7 @@ void SourceReader::makeReadings() {
     while (lastWanted_ == lastBegun_ && !isEnding_) wanted_.wait(mutex_);
     if (isEnding_) return;
     ++lastBegun_;
+    const bool isSample = std::exchange(isSampleWanted_, false);
     mutex_.unlock();
     const Clock::time_point start = Clock::now();
     ReadingPointer reading = source_->read();
@@ -121,6 +123,7 @@ void SourceReader::makeReadings() {
     mutex_.unlock();
     // Releasing a reading may call the source, which must not delay those who ask.
     reading.reset();
+    if (isSample) source_->sampled();
     mutex_.lock();
   }
 }

@@ -51,9 +51,11 @@ class SourceReader {
     std::chrono::milliseconds wait{};
     Clock::time_point deadline{};
   };
+  // What a reading is for: which channels there are, or a sample of a session.
+  enum class Use : std::uint8_t { kFindChannels, kSample };
   // Asks for a reading, which may take that long. Does not block, so several sources can read at
   // the same time.
-  [[nodiscard]] Asked ask(std::chrono::milliseconds wait);
+  [[nodiscard]] Asked ask(std::chrono::milliseconds wait, Use use);
   // Waits for the reading that was asked for; null if it does not come in time. The first time in a
   // row is logged. After that the source is still read, but nobody waits for it until a reading has
   // been in time again.
@@ -86,6 +88,7 @@ class SourceReader {
   std::uint64_t lastBegun_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t lastMade_ HALVOX_GUARDED_BY(mutex_) = 0;
   int waiting_ HALVOX_GUARDED_BY(mutex_) = 0;
+  bool isSampleWanted_ HALVOX_GUARDED_BY(mutex_) = false;
   // The latest reading. Kept only while someone waits, because a source may look at whether its
   // readings are still held.
   ReadingPointer handedOver_ HALVOX_GUARDED_BY(mutex_);

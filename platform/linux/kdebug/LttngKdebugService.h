@@ -1,7 +1,6 @@
 #pragma once
 
 #include <cstdint>
-#include <filesystem>
 #include <memory>
 #include <string>
 #include <variant>
@@ -30,13 +29,9 @@ class NoKdebugService final : public KdebugService {
 // NoKdebugService.
 class LttngKdebugService final : public KdebugService {
  public:
-  // The service, or a text with the reason why the provider cannot be loaded. Call it before other
+  // The service, or a text with the reason why its module cannot be loaded. Call it before other
   // threads start: it may set an environment variable, which is not thread-safe.
-  static std::variant<std::unique_ptr<KdebugService>, std::string> load(
-      const std::filesystem::path& module);
-  // The path of the provider: beside the program if it is there, else the installed one. Empty if
-  // this build has none.
-  static std::filesystem::path modulePath();
+  static std::variant<std::unique_ptr<KdebugService>, std::string> load();
 
   void kdebug_trace(std::uint32_t code, std::uint64_t argument1, std::uint64_t argument2,
                     std::uint64_t argument3, std::uint64_t argument4) override;

@@ -1,10 +1,11 @@
+#include "platform/linux/tracing/NoTraceServices.h"
+
 #include <cstdint>
 #include <functional>
 #include <memory>
 #include <utility>
 
 #include "platform/linux/base/Mutex.h"
-#include "platform/linux/tracing/TraceServices.h"
 #include "platform/services.h"
 
 namespace halvox::platform::linux_ {
@@ -72,7 +73,8 @@ class NoKtraceService final : public KtraceService {
 class NoTraceSession final : public KQTraceSession,
                              public std::enable_shared_from_this<NoTraceSession> {
  public:
-  explicit NoTraceSession(std::shared_ptr<DispatchQueue> queue) : queue_(std::move(queue)) {}
+  NoTraceSession(std::shared_ptr<DispatchQueue> queue, std::string reason)
+      : queue_(std::move(queue)), reason_(std::move(reason)) {}
 
   void setDelegate(std::weak_ptr<KQTraceSessionDelegate> delegate) override {
     const MutexLock lock(mutex_);
@@ -82,9 +84,8 @@ class NoTraceSession final : public KQTraceSession,
     queue_->async(JobWeight::kMayBlock, [self = shared_from_this()] {
       const auto delegate = self->delegate();
       if (delegate == nullptr) return;
-      delegate->kqTraceDidStart(Error{.domain = "com.tarno.halvox.tracing",
-                                      .code = kNoTracer,
-                                      .description = "LTTng is not in this build"});
+      delegate->kqTraceDidStart(Error{
+          .domain = "com.tarno.halvox.tracing", .code = kNoTracer, .description = self->reason_});
     });
   }
   void stopKQTrace() override {}
@@ -96,18 +97,21 @@ class NoTraceSession final : public KQTraceSession,
   }
 
   const std::shared_ptr<DispatchQueue> queue_;
+  const std::string reason_;
   Mutex mutex_;
   std::weak_ptr<KQTraceSessionDelegate> delegate_ HALVOX_GUARDED_BY(mutex_);
 };
 
 class NoPerformanceTraceService final : public PerformanceTraceService {
  public:
+  explicit NoPerformanceTraceService(std::string reason) : reason_(std::move(reason)) {}
+
   std::shared_ptr<KQTraceConfig> configWithTemplate(std::int32_t /*number*/) override {
     return std::make_shared<KQTraceConfig>();
   }
   std::shared_ptr<KQTraceSession> initWithConfig(
       std::shared_ptr<KQTraceConfig> /*configuration*/) override {
-    return std::make_shared<NoTraceSession>(queue());
+    return std::make_shared<NoTraceSession>(queue(), reason_);
   }
   // Releases the queue. Call it after the queues have ended.
   void close() {
@@ -125,32 +129,34 @@ class NoPerformanceTraceService final : public PerformanceTraceService {
     return queue_;
   }
 
+  const std::string reason_;
   Mutex mutex_;
   std::shared_ptr<DispatchQueue> queue_ HALVOX_GUARDED_BY(mutex_);  // made when needed
 };
 
 class NoTraceServices final : public TraceServices {
  public:
+  explicit NoTraceServices(const std::string& reason)
+      : performanceTraces_(reason), description_("none, " + reason) {}
+
   KtraceService& ktrace() override { return ktrace_; }
   PerformanceTraceService& performanceTraces() override { return performanceTraces_; }
   void open() override {}
   void stop() override {}
   void close() override { performanceTraces_.close(); }
   void abandon() override {}
-  [[nodiscard]] std::string description() const override {
-    return "none (LTTng is not in this build)";
-  }
+  [[nodiscard]] std::string description() const override { return description_; }
 
  private:
   NoKtraceService ktrace_;
   NoPerformanceTraceService performanceTraces_;
+  const std::string description_;
 };
 
 }  // namespace
 
-std::unique_ptr<TraceServices> makeTraceServices(const std::filesystem::path& /*storageDirectory*/,
-                                                 StatisticsService& /*statistics*/) {
-  return std::make_unique<NoTraceServices>();
+std::unique_ptr<TraceServices> makeNoTraceServices(const std::string& reason) {
+  return std::make_unique<NoTraceServices>(reason);
 }
 
 }  // namespace halvox::platform::linux_

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <filesystem>
 #include <memory>
 #include <string>
@@ -39,9 +40,26 @@ class TraceServices {
   [[nodiscard]] virtual std::string description() const = 0;
 };
 
-// Services that record with LTTng below the storage directory. In a build without LTTng, services
-// whose traces cannot be started. The statistics must outlive them.
-[[nodiscard]] std::unique_ptr<TraceServices> makeTraceServices(
-    const std::filesystem::path& storageDirectory, StatisticsService& statistics);
+enum class Tracing : std::uint8_t { kDisabled, kEnabled };
+
+struct TraceOptions {
+  std::filesystem::path storageDirectory;  // of the service; traces are below it
+  Tracing tracing = Tracing::kDisabled;    // whether a session may be traced at all
+};
+
+// Returns services that record with LTTng. Loads halvox-tracing-lttng.so for them, which brings the
+// libraries of LTTng's control and of babeltrace2. Returns services whose traces cannot be started,
+// and whose description says why, when tracing is disabled or the module cannot be loaded. The
+// module is also loaded when an earlier service left a recording behind, because only it can remove
+// that. The statistics must outlive the services.
+[[nodiscard]] std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options,
+                                                               StatisticsService& statistics);
+
+// Whether a service that ended in the middle of a trace left something in that directory.
+[[nodiscard]] bool hasTraceLeftovers(const std::filesystem::path& tracesDirectory);
+
+// What is in the directory of traces while one is recorded, and where the tracer's daemon is noted.
+inline constexpr const char* kTraceScratch = "scratch";
+inline constexpr const char* kTraceDaemonNote = "lttng-sessiond";
 
 }  // namespace halvox::platform::linux_

@@ -3,40 +3,19 @@
 #include <array>
 #include <climits>
 #include <cstddef>
-#include <cstdlib>
 #include <filesystem>
 #include <utility>
 
 #include <sys/inotify.h>
 
+#include "platform/linux/drivers/pipewire/ServerSocket.h"
+
 namespace halvox::platform::linux_ {
-namespace {
-
-constexpr const char* kDefaultName = "pipewire-0";
-// The library looks here for a server of the whole machine if the user has none.
-constexpr const char* kSystemDirectory = "/run/pipewire";
-
-std::string remoteName() {
-  const char* name = std::getenv("PIPEWIRE_REMOTE");
-  return name == nullptr || *name == '\0' ? kDefaultName : name;
-}
-
-std::vector<std::string> runtimeDirectories() {
-  for (const char* variable : {"PIPEWIRE_RUNTIME_DIR", "XDG_RUNTIME_DIR", "USERPROFILE"}) {
-    if (const char* directory = std::getenv(variable)) return {directory, kSystemDirectory};
-  }
-  return {kSystemDirectory};
-}
-
-}  // namespace
-
 ServerWatch::ServerWatch(pw_loop* loop, std::function<void()> onAppeared)
     : loop_(loop), onAppeared_(std::move(onAppeared)) {
-  const std::filesystem::path remote = remoteName();
-  name_ = remote.filename();
-  for (const std::string& directory : runtimeDirectories()) {
-    // If the name is absolute, the operator discards the directory.
-    directories_.push_back((std::filesystem::path(directory) / remote).parent_path());
+  for (const std::filesystem::path& path : serverSocketPaths()) {
+    name_ = path.filename();
+    directories_.push_back(path.parent_path());
   }
 }
 

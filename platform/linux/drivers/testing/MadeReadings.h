@@ -20,12 +20,17 @@ namespace halvox::platform::linux_::testing {
 class MadeSource final : public DriverSource {
  public:
   using Make = std::function<std::shared_ptr<const Reading>()>;
-  explicit MadeSource(Make make) : make_(std::move(make)) {}
+  // `onSampled` is called for each reading that was a sample.
+  explicit MadeSource(
+      Make make, std::function<void()> onSampled = [] {})
+      : make_(std::move(make)), onSampled_(std::move(onSampled)) {}
   [[nodiscard]] std::string_view name() const override { return "made"; }
   [[nodiscard]] std::shared_ptr<const Reading> read() override { return make_(); }
+  void sampled() override { onSampled_(); }
 
  private:
   const Make make_;
+  const std::function<void()> onSampled_;
 };
 
 // A counter channel.

@@ -13,7 +13,7 @@ int main() {
   using halvox::platform::KdebugService;
   using halvox::platform::linux_::LttngKdebugService;
 
-  auto loaded = LttngKdebugService::load(LttngKdebugService::modulePath());
+  auto loaded = LttngKdebugService::load();
   if (const auto* reason = std::get_if<std::string>(&loaded)) {
     std::cerr << *reason << '\n';
     return 1;

@@ -25,11 +25,9 @@ class NatsTlmReporting : public TLMReportingService {
   [[nodiscard]] virtual bool close() = 0;
 };
 
-// Whether this build has the NATS back-end.
-[[nodiscard]] bool isNatsBuilt();
-
-// Makes the back-end; returns null if this build does not have it. It connects when the first
-// session starts: a service whose sessions never start needs no server.
+// Makes the back-end. It connects when the first session starts: a service whose sessions never start
+// needs no server. Only in the module and in programs that are linked with what it contains; the
+// service uses loadNatsTlmReporting().
 [[nodiscard]] std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(
     Configuration::Link options, const NatsEnvironment& environment);
 

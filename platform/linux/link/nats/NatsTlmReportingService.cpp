@@ -49,8 +49,6 @@ LogCategory& natsLogCategory() {
   return category;
 }
 
-bool isNatsBuilt() { return true; }
-
 std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(Configuration::Link options,
                                                        const NatsEnvironment& environment) {
   return std::make_unique<NatsTlmReportingService>(std::move(options), environment);

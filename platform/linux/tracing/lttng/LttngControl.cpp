@@ -13,6 +13,7 @@
 #include <unistd.h>
 
 #include "platform/linux/base/UniqueHandle.h"
+#include "platform/linux/tracing/TraceServices.h"
 #include "platform/linux/tracing/lttng/TracerSessions.h"
 
 namespace halvox::platform::linux_ {
@@ -100,9 +101,9 @@ LttngControl::Failure addEvent(lttng_handle* handle, RecordingPlan plan) {
 
 LttngControl::LttngControl(std::filesystem::path tracesDirectory)
     : tracesDirectory_(std::move(tracesDirectory)),
-      scratchDirectory_(tracesDirectory_ / "scratch"),
+      scratchDirectory_(tracesDirectory_ / kTraceScratch),
       recordingDirectory_(tracesDirectory_ / "recording"),
-      daemon_(tracesDirectory_ / "lttng-sessiond") {}
+      daemon_(tracesDirectory_ / kTraceDaemonNote) {}
 
 std::string LttngControl::namePrefix() const {
   // Device and inode identify the directory itself; one directory can have several paths.

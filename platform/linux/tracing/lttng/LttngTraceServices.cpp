@@ -1,4 +1,5 @@
-#include "platform/linux/tracing/TraceServices.h"
+#include "platform/linux/tracing/lttng/LttngTraceServices.h"
+
 #include "platform/linux/tracing/lttng/LttngControl.h"
 #include "platform/linux/tracing/lttng/LttngKtraceService.h"
 #include "platform/linux/tracing/lttng/LttngPerformanceTraceService.h"
@@ -8,8 +9,8 @@ namespace {
 
 class LttngTraceServices final : public TraceServices {
  public:
-  LttngTraceServices(const std::filesystem::path& storageDirectory, StatisticsService& statistics)
-      : control_(storageDirectory / "traces"),
+  LttngTraceServices(const std::filesystem::path& tracesDirectory, StatisticsService& statistics)
+      : control_(tracesDirectory),
         ktrace_(control_, statistics),
         performanceTraces_(control_, statistics) {}
 
@@ -34,9 +35,9 @@ class LttngTraceServices final : public TraceServices {
 
 }  // namespace
 
-std::unique_ptr<TraceServices> makeTraceServices(const std::filesystem::path& storageDirectory,
-                                                 StatisticsService& statistics) {
-  return std::make_unique<LttngTraceServices>(storageDirectory, statistics);
+std::unique_ptr<TraceServices> makeLttngTraceServices(const std::filesystem::path& tracesDirectory,
+                                                      StatisticsService& statistics) {
+  return std::make_unique<LttngTraceServices>(tracesDirectory, statistics);
 }
 
 }  // namespace halvox::platform::linux_

@@ -1,0 +1,73 @@
+#include "platform/linux/drivers/pipewire/PipeWireOnDemand.h"
+
+#include <cstdint>
+#include <filesystem>
+#include <string>
+#include <system_error>
+#include <variant>
+
+#include "platform/linux/drivers/DriverSourceLog.h"
+#include "platform/linux/drivers/pipewire/NodeChannel.h"
+#include "platform/linux/drivers/pipewire/PipeWireEntryPoint.h"
+#include "platform/linux/drivers/pipewire/ServerSocket.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr UnitLog kLog(driversCategory, "PipeWireOnDemand");
+constexpr std::array<std::uint64_t, 1> kNone{0};
+// What a server that is there may take to name its objects. More would make the source late.
+constexpr std::chrono::milliseconds kLongestOpening{800};
+
+bool isModuleThere() {
+  std::error_code ignored;
+  return std::filesystem::exists(modulePath(kPipeWireModule), ignored);
+}
+
+}  // namespace
+
+// What readings hold that were made before the module was loaded. A session that holds one of them
+// then holds a reading of the loaded source too, which follows the server as long as one is held.
+struct PipeWireOnDemand::Lease {
+  std::shared_ptr<const Reading> ofLoaded;
+};
+
+PipeWireOnDemand::PipeWireOnDemand()
+    : connections_{makeChannel(describeNodeChannel(kSinkGroup, "pipewire", "connections")),
+                   makeChannel(describeNodeChannel(kSourceGroup, "pipewire", "connections"))} {}
+
+void PipeWireOnDemand::open() {
+  // A module that is missing is reported at the start, and not at some session.
+  if (hasServerSocket() || !isModuleThere()) load(kLongestOpening);
+}
+
+std::shared_ptr<const Reading> PipeWireOnDemand::read() {
+  if (source_ != nullptr) return source_->read();
+  std::shared_ptr<Lease> lease = lease_.lock();
+  if (lease == nullptr) lease = std::make_shared<Lease>();
+  lease_ = lease;
+  for (const ChannelList::Channel& channel : connections_) maker_.add(channel, kNone);
+  return maker_.finish(std::move(lease));
+}
+
+void PipeWireOnDemand::sampled() {
+  if (source_ != nullptr || isDisabled_) return;
+  // Does not wait: other sessions' samples would wait with it.
+  load(std::chrono::milliseconds::zero());
+  if (source_ == nullptr) return;
+  if (const std::shared_ptr<Lease> lease = lease_.lock()) lease->ofLoaded = source_->read();
+}
+
+void PipeWireOnDemand::load(std::chrono::milliseconds longestOpening) {
+  const auto loaded = loadEntryPoint<decltype(halvox_drivers_pipewire_1)>(kPipeWireModule);
+  if (const auto* why = std::get_if<std::string>(&loaded)) {
+    isDisabled_ = true;
+    kLog.error("drivers.pipewire = true needs ", *why,
+               "; PipeWire's counters are disabled until the next start");
+    return;
+  }
+  source_.reset(std::get<decltype(&halvox_drivers_pipewire_1)>(loaded)(longestOpening));
+  source_->open();
+}
+
+}  // namespace halvox::platform::linux_

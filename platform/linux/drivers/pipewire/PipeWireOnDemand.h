@@ -1,0 +1,43 @@
+#pragma once
+
+#include <array>
+#include <chrono>
+#include <memory>
+
+#include "platform/linux/drivers/DriverSource.h"
+#include "platform/linux/drivers/ReadingMaker.h"
+
+namespace halvox::platform::linux_ {
+
+// The PipeWire source without PipeWire's library, until that is needed: it loads the module with
+// the source when the service starts and there is a server's socket, else when a session takes its
+// first sample. A service that does neither does not map the library.
+//
+//   waiting --socket at the start, or first sample--> loaded
+//      |
+//      +--the module cannot be loaded--> disabled (until the next start)
+//
+// Waiting and disabled, its only channels are the `connections` of a source that has not reached a
+// server. Belongs to the thread of its reader.
+class PipeWireOnDemand final : public DriverSource {
+ public:
+  PipeWireOnDemand();
+
+  [[nodiscard]] std::string_view name() const override { return "pipewire"; }
+  void open() override;
+  [[nodiscard]] std::shared_ptr<const Reading> read() override;
+  void sampled() override;
+
+ private:
+  struct Lease;
+
+  void load(std::chrono::milliseconds longestOpening);
+
+  std::array<ChannelList::Channel, 2> connections_;
+  bool isDisabled_ = false;
+  std::unique_ptr<DriverSource> source_;  // once loaded
+  std::weak_ptr<Lease> lease_;            // of the readings before that
+  ReadingMaker maker_;
+};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,14 @@
+#pragma once
+
+#include "platform/linux/link/nats/NatsTlmReporting.h"
+#include "platform/linux/modules/Module.h"
+
+namespace halvox::platform::linux_ {
+
+inline constexpr Module kNatsModule{"halvox-link-nats.so", "halvox_link_nats_1"};
+
+// Makes the back-end, which the caller owns.
+extern "C" NatsTlmReporting* halvox_link_nats_1(const Configuration::Link& options,
+                                                const NatsEnvironment& environment);
+
+}  // namespace halvox::platform::linux_

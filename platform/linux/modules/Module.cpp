@@ -1,0 +1,54 @@
+#include "platform/linux/modules/Module.h"
+
+#include <string_view>
+#include <system_error>
+
+#include <dlfcn.h>
+
+#include "platform/linux/runtime/Version.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+constexpr const char* kVersionSymbol = "halvox_module_version";
+
+std::string lastError() {
+  const char* const error = ::dlerror();
+  return error == nullptr ? "unknown error" : error;
+}
+
+}  // namespace
+
+std::filesystem::path modulePath(const Module& module) {
+  std::error_code error;
+  const auto program = std::filesystem::read_symlink("/proc/self/exe", error);
+  const auto directory = program.parent_path();
+  auto beside = directory / module.file;
+  if (std::filesystem::exists(beside, error)) return beside;
+  // Relative to the program: an installation that was moved as a whole still finds its modules.
+  return (directory / HALVOX_MODULES_FROM_PROGRAM / module.file).lexically_normal();
+}
+
+std::variant<void*, std::string> loadModule(const Module& module) {
+  return loadModule(module, modulePath(module));
+}
+
+std::variant<void*, std::string> loadModule(const Module& module,
+                                            const std::filesystem::path& path) {
+  const std::string prefix = std::string(module.file) + ": ";
+  // Now: a symbol that the program does not have is an error here, and not the end of the process
+  // at the first call.
+  void* const library = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
+  if (library == nullptr) return prefix + lastError();
+  const auto* const version = static_cast<const char*>(::dlsym(library, kVersionSymbol));
+  if (version == nullptr) return prefix + path.native() + " is not a module of this service";
+  if (std::string_view(version) != halvoxVersion()) {
+    return prefix + path.native() + " is of version " + version + ", the service is of version " +
+           halvoxVersion() + "; install both from one build";
+  }
+  void* const entryPoint = ::dlsym(library, module.entryPoint);
+  if (entryPoint == nullptr) return prefix + lastError();
+  return entryPoint;
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,39 @@
+#pragma once
+
+#include <filesystem>
+#include <string>
+#include <variant>
+
+namespace halvox::platform::linux_ {
+
+// An optional part of the service, in a library of its own. A part with heavy libraries is a
+// module, so that a service that does not use it neither maps nor initialises them.
+struct Module {
+  const char* file;  // such as "halvox-link-nats.so"
+  // The function that makes the part. Its name ends with the version of its signature and of the
+  // classes that it shares with the program: raise it with each change of them.
+  const char* entryPoint;
+};
+
+// Where the module is: beside the program, as in a build, else where it is installed.
+[[nodiscard]] std::filesystem::path modulePath(const Module& module);
+
+// Loads the module and returns the address of its entry point, or why it cannot be loaded. The
+// error names the module, the path and the system's reason. A module of another version of the
+// service is refused, because the classes that both share may differ. The module stays loaded until
+// the process ends: its libraries have threads, and objects of the service refer to its code.
+// Blocks for the disk. Any thread may call.
+[[nodiscard]] std::variant<void*, std::string> loadModule(const Module& module);
+// The same for the module at that path.
+[[nodiscard]] std::variant<void*, std::string> loadModule(const Module& module,
+                                                          const std::filesystem::path& path);
+
+// The same, for an entry point of that type.
+template <typename Function>
+[[nodiscard]] std::variant<Function*, std::string> loadEntryPoint(const Module& module) {
+  auto loaded = loadModule(module);
+  if (auto* why = std::get_if<std::string>(&loaded)) return std::move(*why);
+  return reinterpret_cast<Function*>(std::get<void*>(loaded));
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,14 @@
+#pragma once
+
+#include <filesystem>
+#include <memory>
+
+#include "platform/linux/tracing/TraceServices.h"
+
+namespace halvox::platform::linux_ {
+
+// Traces by LTTng, recorded in that directory. The statistics must outlive them.
+[[nodiscard]] std::unique_ptr<TraceServices> makeLttngTraceServices(
+    const std::filesystem::path& tracesDirectory, StatisticsService& statistics);
+
+}  // namespace halvox::platform::linux_
