@@ -90,7 +90,7 @@ class ModulesTest(unittest.TestCase):
         self.start_session(service)
 
         wait_for("PipeWire's library", lambda: heavy(service) == ["libpipewire", PIPEWIRE])
-        self.assertNotIn("did not come within", service.log())
+        self.assertNotIn("did not answer within", service.log())
 
     def test_pipewire_is_loaded_at_the_start_when_there_is_a_server(self):
         self.require(PIPEWIRE)

@@ -25,9 +25,9 @@ class NatsTlmReporting : public TLMReportingService {
   [[nodiscard]] virtual bool close() = 0;
 };
 
-// Makes the back-end. It connects when the first session starts: a service whose sessions never start
-// needs no server. Only in the module and in programs that are linked with what it contains; the
-// service uses loadNatsTlmReporting().
+// Makes the back-end. It connects when the first session starts: a service whose sessions never
+// start needs no server. Only in the module and in programs that are linked with what it contains;
+// the service uses loadNatsTlmReporting().
 [[nodiscard]] std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(
     Configuration::Link options, const NatsEnvironment& environment);
 
