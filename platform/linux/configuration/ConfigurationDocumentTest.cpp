@@ -13,7 +13,7 @@
 
 #include "platform/linux/configuration/Configuration.h"
 
-// Holds docs/configuration.md against what is read.
+// Compares docs/configuration.md with the keys and defaults that the service has.
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -32,7 +32,7 @@ Keys allMatches(const std::string& text, const std::regex& pattern) {
   return keys;
 }
 
-// The names in the first column of the page's tables; "KEY, KEY" are two.
+// The names in the first columns of the page's tables. A cell can have several.
 Keys documentedKeys() {
   Keys keys;
   std::istringstream lines(readFile(HALVOX_CONFIGURATION_PAGE));
@@ -45,7 +45,7 @@ Keys documentedKeys() {
   return keys;
 }
 
-// A file that gives every key the default that the page has for it, where that is a TOML value.
+// A file with the page's default for every key whose default is a TOML value.
 std::string documentedDefaults() {
   std::istringstream lines(readFile(HALVOX_CONFIGURATION_PAGE));
   static const std::regex kHeading("^### `(\\[[a-z]+\\])`$");
@@ -56,7 +56,7 @@ std::string documentedDefaults() {
   for (std::string line; std::getline(lines, line);) {
     std::smatch match;
     if (line.starts_with("### ")) {
-      // Tables below others are there or not, which means something of its own.
+      // Not [link.tls]: its presence alone changes the configuration.
       isInTable = std::regex_match(line, match, kHeading);
       if (isInTable) text += match[1].str() + "\n";
     } else if (isInTable && std::regex_search(line, match, kDefault)) {

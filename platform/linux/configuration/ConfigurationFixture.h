@@ -25,7 +25,7 @@ inline constexpr const char* kVariables[] = {"HALVOX_CONFIG",
                                              "XDG_STATE_HOME",
                                              "HOME"};
 
-// A scratch directory as home, and no other variable set that the configuration looks at.
+// Sets a scratch directory as home and unsets all other variables that the configuration reads.
 class ConfigurationFixture : public ::testing::Test {
  protected:
   void SetUp() override {
@@ -58,7 +58,7 @@ class ConfigurationFixture : public ::testing::Test {
     }
     return std::get<Configuration>(std::move(result));
   }
-  // What is wrong with that text, without the file's name.
+  // The error for a file with `text`, without the file's name.
   std::string mistake(std::string_view text) {
     const auto result = load(text);
     const auto* error = std::get_if<ConfigurationError>(&result);

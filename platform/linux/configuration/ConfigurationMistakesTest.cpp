@@ -2,7 +2,7 @@
 
 #include "platform/linux/configuration/ConfigurationFixture.h"
 
-// What is wrong with a configuration is told with its place.
+// A mistake in a configuration is reported with its place.
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -138,7 +138,7 @@ TEST_F(ConfigurationMistakesTest, SocketPathMustFitIntoAnAddress) {
               HasSubstr("listener.socket: expected an absolute path of at most 107 bytes, found"));
 }
 
-// Walking through as many tables as such a key makes would end the process.
+// Walking through the tables that such a key makes would overflow the stack.
 TEST_F(ConfigurationMistakesTest, KeyOfManyWordsIsToldWithItsLine) {
   std::string key = "a";
   for (int count = 1; count < 100'000; ++count) key += ".a";

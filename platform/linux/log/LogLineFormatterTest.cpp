@@ -17,7 +17,7 @@ class LogLineFormatterTest : public testing::Test {
     zone == nullptr ? ::unsetenv("TZ") : ::setenv("TZ", zone, 1);
     ::tzset();
   }
-  // The line at a time since 1970.
+  // The line of an entry at `time` since 1970.
   std::string lineAt(milliseconds time, LogLevel level = LogLevel::kError) {
     const std::string text = "it broke";
     return std::string(formatter_.format({.time = std::chrono::sys_time<milliseconds>(time),

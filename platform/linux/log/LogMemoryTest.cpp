@@ -29,7 +29,7 @@ LogEntry entryOf(std::string_view line, LogLevel level = LogLevel::kInfo) {
 
 void add(LogMemory& memory, std::string_view line) { memory.add(entryOf(line), line); }
 
-// What stands behind the last blank of each line.
+// The text after the last blank of each line.
 std::vector<std::string> words(const LogMemory& memory) {
   const std::string text = memory.contents().text;
   std::vector<std::string> found;
@@ -77,7 +77,7 @@ TEST(LogMemoryTest, OldestLinesMakeRoomWhenTheBytesAreUsedUp) {
 
   for (const char* line : {"aaaa", "bbbb", "cccc"}) add(memory, line);
 
-  // The third begins again at the front, over the first; the second lies behind it untouched.
+  // The third text overwrites the first, at the start of the ring; the second stays as it is.
   EXPECT_THAT(words(memory), ElementsAre("bbbb", "cccc"));
 }
 

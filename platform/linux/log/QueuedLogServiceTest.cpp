@@ -34,7 +34,7 @@ struct Pipe {
     reader.reset(ends[0]);
     writer.reset(ends[1]);
   }
-  // All that was written, once nobody can write any more.
+  // Closes the end for writing and returns everything that was written.
   std::string readAll() {
     writer.reset();
     std::string text;
@@ -61,7 +61,7 @@ class QueuedLogServiceTest : public ::testing::Test {
     make(std::move(sink));
     return memory;
   }
-  // The only line that is written to a pipe for that text.
+  // What the service writes to a pipe for one line.
   std::string writtenText(LogLevel level, std::string_view text) {
     Pipe pipe;
     make(makeTextLogSink(pipe.writer.get()));

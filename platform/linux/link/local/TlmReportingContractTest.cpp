@@ -1,4 +1,4 @@
-// The contract of the real-time framework, kept by the adapters of this folder.
+// Runs the contract suite of the real-time framework on the adapters of this folder.
 
 #include "platform/fake/contracts/TlmReportingContract.h"
 

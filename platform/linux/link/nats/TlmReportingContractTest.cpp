@@ -1,4 +1,4 @@
-// The contract of the real-time framework, kept by the adapter over NATS with a server of its own.
+// Runs the contract suite of the real-time framework on the adapter over NATS, with a real server.
 
 #include "platform/fake/contracts/TlmReportingContract.h"
 
@@ -43,7 +43,7 @@ sockaddr_in loopback(int port) {
   return address;
 }
 
-// A port of loopback that was free a moment ago.
+// A loopback port that was free a moment ago.
 int freePort() {
   const UniqueFd socket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
   sockaddr_in address = loopback(0);
@@ -60,11 +60,11 @@ bool accepts(int port) {
   return ::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
 }
 
-// One nats-server with JetStream in a scratch directory, for all tests of this program; it ends
-// with it.
+// One nats-server with JetStream in a scratch directory, for all tests of this program. The kernel
+// kills it when the program ends, however it ends.
 class NatsServer {
  public:
-  // Null when it is not installed or does not start.
+  // Null if nats-server is not installed or does not start.
   static NatsServer* shared() {
     static const auto server = std::make_unique<NatsServer>();
     return server->isUp_ ? server.get() : nullptr;
@@ -109,7 +109,7 @@ class NatsServer {
   bool isUp_ = false;
 };
 
-// What the service's neighbours are, as long as the process: the back-end keeps its log category.
+// The other services. Never destroyed: the back-end keeps a reference to its log category.
 FakePlatform& neighbours() {
   static auto* const platform = new FakePlatform;
   return *platform;

@@ -1,5 +1,5 @@
-// Drives the NATS back-end with its real neighbours, as sessions would: reads one command a line
-// and answers each with one line. The configuration is the one that $HALVOX_CONFIG names.
+// Drives the NATS back-end with the real dispatch service, as sessions would. Reads one command a
+// line and answers each with one line. The configuration is the one that $HALVOX_CONFIG names.
 //
 //   start FIRST COUNT BATCH SERVICE   makes sessions and starts their discovery: "started"
 //   found ID       waits for the discovery of a session: "servers MILLISECONDS [URLS]", or "none …"
@@ -34,7 +34,7 @@ using namespace halvox::platform;
 using namespace halvox::platform::linux_;
 using Clock = std::chrono::steady_clock;
 
-// One event that another thread announces, with a text, and how long it took.
+// An event that another thread announces, with a text, and the time until then.
 class Announcement {
  public:
   void announce(std::string text) {

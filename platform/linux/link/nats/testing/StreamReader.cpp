@@ -1,6 +1,6 @@
 // Prints what a stream holds, one JSON object a line:
-// {"subject":…,"sequence":…,"id":…,"message":…}. A plain subscriber of its own, which shares
-// nothing with what it checks.
+// {"subject":…,"sequence":…,"id":…,"message":…}. An independent subscriber: it shares no code with
+// the back-end that it checks, except the handles.
 //
 //   halvox_stream_reader URL STREAM
 #include <cstdint>
