@@ -6,8 +6,8 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/linux/dispatch/BatchedTurns.h"
 #include "platform/linux/dispatch/DispatchPool.h"
+#include "platform/linux/dispatch/DispatchThread.h"
 #include "platform/linux/dispatch/JobRunner.h"
 #include "platform/linux/dispatch/OwnThreadQueue.h"
 #include "platform/linux/dispatch/SharedQueue.h"
@@ -38,16 +38,16 @@ void AsioDispatchService::asyncAfterOnBackgroundQueue(std::chrono::nanoseconds d
   pool_->delayedJobs().add(delay, QualityOfService::kBackground, std::move(job));
 }
 
-void AsioDispatchService::beginHelping() { HelpingThread::current().begin(); }
+void AsioDispatchService::beginHelping() { DispatchThread::current().beginHelping(); }
 
-void AsioDispatchService::endHelping() { HelpingThread::current().end(); }
+void AsioDispatchService::endHelping() { DispatchThread::current().endHelping(); }
 
-void AsioDispatchService::holdPool() { BatchedTurns::current().begin(); }
+void AsioDispatchService::holdPool() { DispatchThread::current().holdPool(); }
 
-void AsioDispatchService::wakePool() { BatchedTurns::current().end(); }
+void AsioDispatchService::wakePool() { DispatchThread::current().wakePool(); }
 
 void AsioDispatchService::finish(std::chrono::milliseconds limit) {
-  wakePool();  // what this thread still holds back
+  wakePool();  // for the turns that this thread still holds back
   pool_->waitUntilIdle(std::chrono::steady_clock::now() + limit);
 }
 
@@ -78,14 +78,14 @@ bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
 }
 
 void AsioDispatchService::logStuck(const std::vector<std::string>& labels) {
-  std::string text = "jobs have not ended in time and are left behind, of the queues:";
+  std::string text = "jobs still run at the end of the time to stop; ending without them. Queues:";
   for (const std::string& label : labels) text += " \"" + label + "\"";
   if (labels.empty()) text += " the background queue";
   log_.write(LogLevel::kError, detail::logPrefix("AsioDispatchService", __LINE__) + text);
 }
 
-// None when the system has no thread to give or the service has stopped: the caller's jobs then run
-// on the pool, or not at all.
+// Null when the system has no thread to give or the service has stopped. The caller then uses the
+// pool, which discards the jobs if the service has stopped.
 std::shared_ptr<DispatchQueue> AsioDispatchService::createOwnThreadQueue(std::string_view label,
                                                                          QualityOfService quality) {
   const MutexLock lock(mutex_);
@@ -94,14 +94,15 @@ std::shared_ptr<DispatchQueue> AsioDispatchService::createOwnThreadQueue(std::st
   try {
     auto queue = OwnThreadQueue::start(std::string(label), quality, runner_);
     ownThreadQueues_.push_back(queue);
-    // What is handed out closes the queue when its last holder lets go; the queue itself stays here
-    // until its thread has ended, so that the thread never has to wait for itself.
+    // The pointer that is handed out closes the queue when its last holder releases it. The queue
+    // itself stays here until its thread has ended: a job may be the last holder, and its thread
+    // cannot join itself.
     DispatchQueue* const face = queue.get();
     return {face, [queue = std::move(queue)](DispatchQueue*) { queue->close(); }};
   } catch (const std::system_error& error) {
     log_.write(LogLevel::kError, detail::logPrefix("AsioDispatchService", __LINE__) +
-                                     "no thread for queue " + std::string(label) +
-                                     ", it uses the pool: " + error.what());
+                                     "cannot start a thread for queue \"" + std::string(label) +
+                                     "\" (" + error.what() + "); its jobs run on the pool");
     return nullptr;
   }
 }

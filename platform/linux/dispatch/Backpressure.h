@@ -6,14 +6,18 @@
 
 namespace halvox::platform::linux_ {
 
-// One bit by which a slow consumer of messages tells the readers of connections to let the busiest
-// of them wait. The consumer raises and relieves it; any thread may look.
+// One bit by which a slow consumer of messages asks the readers of connections to slow down the
+// busiest clients. The consumer (the store) raises and relieves it; any thread may read it. Owned
+// by the platform, which outlives both sides.
+//
+//   low --raise()--> high --relieve(): calls the handler--> low
 class Backpressure {
  public:
-  // Set before the first thread starts. Called on the consumer's thread; must not block.
+  // Call before the first thread starts. The handler runs on the consumer's thread and must not
+  // block.
   void setReliefHandler(std::function<void()> handler) { onRelief_ = std::move(handler); }
 
-  // Orders with nothing: a reader that sees it late reads a little more.
+  // Relaxed: a reader that sees the bit late only reads a few more requests.
   [[nodiscard]] bool isHigh() const { return high_.load(std::memory_order_relaxed); }
   void raise() { high_.store(true, std::memory_order_relaxed); }
   void relieve() {

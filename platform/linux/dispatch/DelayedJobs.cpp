@@ -10,14 +10,15 @@
 #include <unistd.h>
 
 #include "platform/linux/dispatch/DispatchPool.h"
+#include "platform/linux/dispatch/DispatchThread.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
-// Far below the end of the clock, which is some 292 years after the start of the machine.
+// The clock ends 292 years after the start of the machine. A delay up to ten years cannot overflow.
 constexpr std::chrono::nanoseconds kLongestDelay = std::chrono::hours(24 * 3652);
 
-// Of the clock that std::chrono::steady_clock reads.
+// CLOCK_MONOTONIC is what std::chrono::steady_clock reads, so its times can be used unchanged.
 int createTimer() {
   const int timer = ::timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK);
   if (timer < 0) throw std::system_error(errno, std::generic_category(), "timerfd_create");
@@ -48,7 +49,7 @@ DelayedJobs::Ticket DelayedJobs::add(std::chrono::nanoseconds delay, QualityOfSe
 }
 
 void DelayedJobs::cancel(const Ticket& ticket) {
-  Delayed cancelled;  // goes when the lock is no longer held
+  Delayed cancelled;  // destroyed after the lock has been released
   const MutexLock lock(mutex_);
   const auto place = jobs_.find(ticket);
   if (place == jobs_.end()) return;
@@ -70,7 +71,7 @@ void DelayedJobs::stop() {
 }
 
 void DelayedJobs::arm() {
-  itimerspec when{};  // all zero: never
+  itimerspec when{};  // all zero disables the timer
   armedFor_.reset();
   if (!jobs_.empty()) {
     armedFor_ = jobs_.begin()->first.first;
@@ -93,7 +94,7 @@ void DelayedJobs::onTimer() {
   const MutexLock lock(mutex_);
   if (isStopped_) return;
   std::uint64_t expirations = 0;
-  // Nothing to read when the timer was set anew after it had gone off: then it will go off again.
+  // Nothing can be read if the timer was set again after it had expired. It then expires again.
   if (::read(timer_.native_handle(), &expirations, sizeof(expirations)) > 0) {
     const Time now = std::chrono::steady_clock::now();
     while (!jobs_.empty() && jobs_.begin()->first.first <= now) {
@@ -113,7 +114,7 @@ void DelayedJobs::runDue(const Job& job) {
     isStopped = isStopped_;
   }
   if (isStopped) return pool_.runner().countDiscarded(1);
-  const JobRunner::Scope scope(nullptr, "delayed");
+  const DispatchThread::Working working(nullptr, "delayed");
   pool_.runner().run(job);
 }
 

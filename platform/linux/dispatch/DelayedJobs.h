@@ -16,26 +16,29 @@ namespace halvox::platform::linux_ {
 
 class DispatchPool;
 
-// Jobs that wait for their time: any number of them with one timer of the kernel and no thread. The
-// timer is always set for the earliest job and for nothing else: where a wait ends before its
-// time-out, nothing wakes up when that would have come. (asio's own timers leave that wake-up.)
-// Any thread may add jobs; they run on the pool's threads of their quality, in no order with
-// others. Belongs to the pool, whose utility threads look after the timer: jobs of a lower quality
-// that take their time cannot delay it. No thread may run when it is destroyed.
+// Jobs that run after a delay: any number of them, with one kernel timer and without a thread.
+//
+// The timer is always set for the earliest job and for nothing else. A wait that ends before its
+// time-out therefore leaves no wake-up behind; Asio's own timers would. The pool's utility threads
+// watch the timer, because background jobs, which may take long, must not delay it.
+//
+// Owned by the pool. Any thread may add jobs. Due jobs run on the pool's threads of their quality,
+// in no order with others. The number of jobs has no bound: what waits is charged to clients. No
+// pool thread may run when this is destroyed.
 class DelayedJobs {
  public:
-  // By its time, then by the order of coming.
+  // Names a job. Sorted by the time when it is due, then by the order of adding.
   using Time = std::chrono::steady_clock::time_point;
   using Ticket = std::pair<Time, std::uint64_t>;
 
   // Throws std::system_error when the system has no descriptor to give.
   explicit DelayedJobs(DispatchPool& pool);
 
-  // Runs the job after that delay; a negative one is none, one of more than ten years is ten years.
+  // Runs the job after the delay. A negative delay counts as 0, one above ten years as ten years.
   Ticket add(std::chrono::nanoseconds delay, QualityOfService quality, Job job);
-  // Lets a job go whose time has not come; one that is on its way, or gone, is left alone.
+  // Destroys a job that is not due yet. Does nothing to a job that is about to run or has run.
   void cancel(const Ticket& ticket);
-  // Discards the jobs that wait and those to come.
+  // Discards and counts all jobs, and those added later.
   void stop();
 
  private:
@@ -44,7 +47,7 @@ class DelayedJobs {
     Job job;
   };
 
-  // Sets the timer for the earliest job, or stops it when there is none.
+  // Sets the timer for the earliest job, or disables it when there is none.
   void arm() HALVOX_REQUIRES(mutex_);
   void awaitTimer() HALVOX_REQUIRES(mutex_);
   void onTimer();

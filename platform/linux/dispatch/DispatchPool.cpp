@@ -9,7 +9,7 @@ DispatchPool::DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService&
     : runner_(std::move(runner)), labels_(statistics) {
   if (!utility_.provide()) {
     throw std::system_error(std::make_error_code(std::errc::resource_unavailable_try_again),
-                            "no threads for the queues");
+                            "cannot start the threads of the queues");
   }
 }
 
@@ -18,8 +18,9 @@ DispatchPool::~DispatchPool() {
   static_cast<void>(waitForEnd(std::chrono::steady_clock::time_point::max()));
 }
 
-// Threads for background work are made by those for utility work, which look after the timer; so
-// none begins with a lower priority than it should have.
+// A new thread starts with the priority of the thread that makes it. Background threads are made by
+// callers of at least utility priority (the timer is watched by utility threads), so no thread gets
+// a lower priority than its quality's.
 asio::io_context& DispatchPool::context(QualityOfService quality) {
   switch (quality) {
     case QualityOfService::kUserInteractive:
@@ -39,7 +40,7 @@ void DispatchPool::waitUntilIdle(std::chrono::steady_clock::time_point deadline)
   }
 }
 
-void DispatchPool::tellIdle() {
+void DispatchPool::reportIdle() {
   const MutexLock lock(mutex_);
   idle_.notifyAll();
 }
@@ -57,7 +58,7 @@ bool DispatchPool::waitForEnd(std::chrono::steady_clock::time_point deadline) {
 }
 
 void DispatchPool::discardJobs() {
-  // Each handler sees the stop and lets its jobs go without running them.
+  // Each posted handler sees the stop and destroys its jobs without running them.
   for (PoolThreads* const threads : {&urgent_, &utility_, &background_}) threads->discardJobs();
   waits_.discard();
 }

@@ -17,53 +17,58 @@
 
 namespace halvox::platform::linux_ {
 
-// What all shared queues and delayed jobs run on: threads for each quality of service. Those for
-// utility work are there from the beginning, the others are made when there is a job for them.
-// Where the system has no more threads to give, the utility threads do the others' work.
-// Shared by the service, the shared queues and the semaphores; the service stops it.
+// The threads on which all shared queues and delayed jobs run, a group for each quality of service.
+// The utility threads start with the pool, because they watch the timer. The others start with the
+// first job for them. If the system has no more threads to give, the utility threads do their work.
+//
+//   running --stop()--> stopping --waitForEnd()--> ended --discardJobs()--> empty
+//
+// Shared by the service, the shared queues and the semaphores, which may outlive the service. The
+// service stops it. Any thread may call.
 class DispatchPool {
  public:
   // Throws std::system_error when the system has no threads to give. `statistics` must outlive it.
   DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService& statistics);
   DispatchPool(const DispatchPool&) = delete;
   DispatchPool& operator=(const DispatchPool&) = delete;
-  // Waits for the jobs that run.
+  // Stops, and waits for the running jobs.
   ~DispatchPool();
 
-  // What the threads of that quality run. The jobs that it is given must see for themselves whether
+  // The run queue of the threads of that quality. What is posted to it must itself check whether
   // the pool has stopped.
   [[nodiscard]] asio::io_context& context(QualityOfService quality);
   [[nodiscard]] JobRunner& runner() { return *runner_; }
   [[nodiscard]] QueueLabels& labels() { return labels_; }
   [[nodiscard]] DelayedJobs& delayedJobs() { return delayedJobs_; }
   [[nodiscard]] DispatchWaits& waits() { return waits_; }
-  // Orders with nothing: jobs that are added during the stop may go either way.
+  // Relaxed: jobs that are added during the stop may be run or discarded.
   [[nodiscard]] bool isStopped() const { return isStopped_.load(std::memory_order_relaxed); }
 
-  // Each turn of a queue is told of: when one is to come, and when the queue has nothing left to
-  // run.
+  // Queues report each turn: when they ask for it, and when they have nothing left to run.
   void beginTurn() { turns_.fetch_add(1); }
   void endTurn() {
-    if (turns_.fetch_sub(1) == 1 && isAwaited_.load()) tellIdle();
+    if (turns_.fetch_sub(1) == 1 && isAwaited_.load()) reportIdle();
   }
-  // Waits until no queue has a job that may run now, at most until that time. Queues that wait on
-  // semaphores and jobs whose time has not come are not waited for.
+  // Waits until no queue has a job that can run now, at most until that time. Does not wait for
+  // queues that wait on semaphores, nor for delayed jobs that are not due.
   void waitUntilIdle(std::chrono::steady_clock::time_point deadline);
 
-  // Lets the threads end after the jobs that run; discards all others, and ends no wait any more.
+  // Lets the threads end after the jobs that they run. From now on no wait ends.
   void stop();
-  // Waits for their end until that time; false when a job still runs then. After stop() only.
+  // Waits for the end of the threads, at most until that time. False when a job still runs then.
+  // Call after stop().
   bool waitForEnd(std::chrono::steady_clock::time_point deadline);
-  // Destroys the discarded jobs and waits, which may hold the queues that hold the pool. Call only
-  // after waitForEnd() has returned true.
+  // Destroys the discarded jobs and waits. Needed because they may hold queues, which hold the
+  // pool. Call after waitForEnd() has returned true.
   void discardJobs();
 
  private:
-  void tellIdle() HALVOX_EXCLUDES(mutex_);
+  void reportIdle() HALVOX_EXCLUDES(mutex_);
 
   const std::shared_ptr<JobRunner> runner_;
   QueueLabels labels_;
-  // Ordered with each other, so that the end of the last turn cannot miss whoever begins to wait.
+  // Sequentially consistent with each other: either waitUntilIdle() sees that the last turn has
+  // ended, or endTurn() sees that somebody waits.
   std::atomic<std::int64_t> turns_{0};
   std::atomic<bool> isAwaited_{false};
   Mutex mutex_;

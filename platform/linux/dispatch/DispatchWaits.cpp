@@ -9,7 +9,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-void goOn(DispatchWaits::Wait wait, WaitOutcome outcome) {
+void resume(DispatchWaits::Wait wait, WaitOutcome outcome) {
   wait.queue->resume([then = std::move(wait.then), outcome] { then(outcome); });
 }
 
@@ -24,7 +24,7 @@ void DispatchWaits::begin(std::shared_ptr<SharedQueue> queue,
     const MutexLock lock(mutex_);
     outcome = tryEnd(semaphore, timeout, wait);
   }
-  if (outcome.has_value()) goOn(std::move(wait), *outcome);
+  if (outcome.has_value()) resume(std::move(wait), *outcome);
 }
 
 std::optional<WaitOutcome> DispatchWaits::tryEnd(const std::shared_ptr<SharedSemaphore>& semaphore,
@@ -59,7 +59,7 @@ void DispatchWaits::signal(SharedSemaphore& semaphore) {
     }
     wait = take(semaphore, semaphore.waits_.begin());
   }
-  goOn(std::move(wait), WaitOutcome::kSignalled);
+  resume(std::move(wait), WaitOutcome::kSignalled);
 }
 
 void DispatchWaits::block(SharedSemaphore& semaphore) {
@@ -75,15 +75,15 @@ void DispatchWaits::timeOut(const std::weak_ptr<SharedSemaphore>& weakSemaphore,
   Wait wait;
   {
     const MutexLock lock(mutex_);
-    // A signal may have come while this was on its way.
+    // A signal may have ended the wait after the time-out became due.
     const auto place = semaphore->waits_.find(number);
     if (isStopped_ || place == semaphore->waits_.end()) return;
     wait = take(*semaphore, place);
   }
-  goOn(std::move(wait), WaitOutcome::kTimedOut);
+  resume(std::move(wait), WaitOutcome::kTimedOut);
 }
 
-// The caller holds the semaphore.
+// The caller must hold the semaphore: its last wait may be its last owner.
 DispatchWaits::Wait DispatchWaits::take(SharedSemaphore& semaphore, Waits::iterator place) {
   Wait wait = std::move(place->second);
   semaphore.waits_.erase(place);

@@ -20,14 +20,15 @@ class DispatchPool;
 class SharedQueue;
 class SharedSemaphore;
 
-// The queues of a pool that wait on semaphores. A wait is an entry here and, with a time-out, one
-// of the delayed jobs; it has no thread, and what ends it first takes both away.
+// The shared queues that wait on semaphores. A wait is an entry here and, if it has a time-out, a
+// delayed job. It takes no thread. Whichever ends it first, a signal or the time-out, removes both.
 //
-//   begin() --a signal is there--> queue goes on
-//           --none--> waiting --signal() or time-out--> queue goes on
+//   begin() --a signal is kept--> the queue continues
+//           --none--> waiting --signal() or time-out--> the queue continues
 //                             --discard()--> the queue's jobs are discarded
 //
-// Any thread may call. `delayedJobs` and `runner` must outlive it. Has no bound: each queue waits
+// Owned by the pool. Any thread may call. One mutex for all semaphores: waits are as rare as starts
+// and stops of sessions. The number of waits is bounded by the number of queues, since each waits
 // once.
 class DispatchWaits {
  public:
@@ -37,28 +38,30 @@ class DispatchWaits {
     Then then;
     std::optional<DelayedJobs::Ticket> timeout;
   };
-  // In the order in which they began.
+  // By number: the first one began first.
   using Waits = std::map<std::uint64_t, Wait>;
 
+  // Both must outlive this.
   DispatchWaits(DelayedJobs& delayedJobs, JobRunner& runner)
       : delayedJobs_(delayedJobs), runner_(runner) {}
 
-  // The queue must run no job from now on until its resume() was called, which may happen within.
+  // The queue must not run a job until its resume() is called, which can happen before this
+  // returns.
   void begin(std::shared_ptr<SharedQueue> queue, const std::shared_ptr<SharedSemaphore>& semaphore,
              std::optional<std::chrono::nanoseconds> timeout, Then then);
-  // Ends the wait that began first, or keeps the signal.
+  // Ends the wait that began first. Without one, keeps the signal.
   void signal(SharedSemaphore& semaphore);
-  // Blocks this thread until there is a signal that no wait of a queue took.
+  // Blocks the calling thread until a signal is kept, and consumes it. Waits of queues come first.
   void block(SharedSemaphore& semaphore);
-  // No wait begins or ends from now on.
+  // From now on no wait ends.
   void stop();
-  // Destroys the waits with what they hold, and the jobs of their queues. After stop(), when no job
-  // runs any more.
+  // Destroys the waits with what they hold, and the jobs of their queues. Call after stop(), when
+  // no job runs any more.
   void discard();
 
  private:
   void timeOut(const std::weak_ptr<SharedSemaphore>& weakSemaphore, std::uint64_t number);
-  // Adds the wait, unless it ends at once: then what it came to.
+  // Adds the wait, or returns its outcome if it ends at once.
   std::optional<WaitOutcome> tryEnd(const std::shared_ptr<SharedSemaphore>& semaphore,
                                     std::optional<std::chrono::nanoseconds> timeout, Wait& wait)
       HALVOX_REQUIRES(mutex_);
@@ -70,11 +73,12 @@ class DispatchWaits {
   Mutex mutex_;
   bool isStopped_ HALVOX_GUARDED_BY(mutex_) = false;
   std::uint64_t begun_ HALVOX_GUARDED_BY(mutex_) = 0;
-  // Those that are waited on; the waits keep them.
+  // The semaphores with waits. A wait keeps its semaphore alive.
   std::unordered_set<std::shared_ptr<SharedSemaphore>> semaphores_ HALVOX_GUARDED_BY(mutex_);
 };
 
-// The signals that nobody consumed yet and the waits for the next ones.
+// The signals that nobody has consumed yet, and the waits for the next ones. Shared by whoever
+// signals and whoever waits. Any thread may call.
 class SharedSemaphore final : public DispatchSemaphore,
                               public std::enable_shared_from_this<SharedSemaphore> {
  public:
@@ -88,7 +92,7 @@ class SharedSemaphore final : public DispatchSemaphore,
   friend class DispatchWaits;
 
   const std::shared_ptr<DispatchPool> pool_;
-  // Both under the mutex of the pool's DispatchWaits; never both more than nothing.
+  // Guarded by the mutex of the pool's DispatchWaits. One of the two is always empty.
   std::uint64_t signals_;
   DispatchWaits::Waits waits_;
   Condition signalled_;  // a signal was kept

@@ -3,6 +3,8 @@
 #include <exception>
 #include <string>
 
+#include "platform/linux/dispatch/DispatchThread.h"
+
 namespace halvox::platform::linux_ {
 
 JobRunner::JobRunner(LogService& log, StatisticsService& statistics)
@@ -12,7 +14,7 @@ JobRunner::JobRunner(LogService& log, StatisticsService& statistics)
 
 void JobRunner::reportFailure() noexcept {
   failed_.add();
-  std::string what = "of an unknown kind";
+  std::string what = "an exception of an unknown kind";
   try {
     throw;
   } catch (const std::exception& exception) {
@@ -21,8 +23,8 @@ void JobRunner::reportFailure() noexcept {
     // Nothing more is known about it.
   }
   log_.write(LogLevel::kError, detail::logPrefix("JobRunner", __LINE__) + "a job of queue \"" +
-                                   std::string(currentLabel_) +
-                                   "\" failed with an exception, the queue goes on: " + what);
+                                   std::string(DispatchThread::current().label()) + "\" failed: " +
+                                   what + "; the queue continues with its next job");
 }
 
 }  // namespace halvox::platform::linux_

@@ -1,16 +1,15 @@
 #include "platform/linux/dispatch/OwnThreadQueue.h"
 
 #include <stdexcept>
+#include <utility>
 
-#include "platform/linux/dispatch/BatchedTurns.h"
 #include "platform/linux/dispatch/ThreadPriorities.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
-// How many jobs one end of helping may run before it leaves the rest to the queues' own threads.
-constexpr std::size_t kHelpedJobsLimit = 1000;
-// Room for jobs that a queue keeps when it has nothing to do.
+// The number of jobs for which an idle queue keeps room. A queue that once had more gives the
+// memory back.
 constexpr std::size_t kKeptCapacity = 4096;
 
 }  // namespace
@@ -33,18 +32,18 @@ OwnThreadQueue::~OwnThreadQueue() {
 }
 
 void OwnThreadQueue::async(JobWeight weight, Job job) {
-  HelpingThread& helper = HelpingThread::current();
-  const bool mayHelp = weight == JobWeight::kBrief && helper.isActive();
+  DispatchThread& helper = DispatchThread::current();
+  const bool mayHelp = weight == JobWeight::kBrief && helper.isHelping();
   bool isNewForHelper = false;
   bool mustWake = false;
   {
     const MutexLock lock(mutex_);
     if (life_ == Life::kStopped) {
       runner_->countDiscarded(1);
-      return;  // the job goes with the arguments, when the lock is given back
+      return;  // the job is destroyed with the arguments, after the lock has been released
     }
     waiting_.push_back({std::move(job), weight});
-    if (hasWorker_) return;  // the worker looks again before it leaves
+    if (hasWorker_) return;  // the worker looks for new jobs before it ends its work
     if (mayHelp && helper_ == &helper) return;
     isNewForHelper = mayHelp && helper_ == nullptr;
     if (isNewForHelper) {
@@ -53,14 +52,14 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
       mustWake = takeWakeUp();
     }
   }
-  if (isNewForHelper) helper.note(shared_from_this());
+  if (isNewForHelper) helper.noteQueueToHelp(shared_from_this());
   if (mustWake) wakeUp_.notifyOne();
 }
 
 void OwnThreadQueue::waitOn(std::shared_ptr<DispatchSemaphore> /*semaphore*/,
                             std::optional<std::chrono::nanoseconds> /*timeout*/,
                             std::function<void(WaitOutcome)> /*then*/) {
-  throw std::logic_error("a queue with a thread of its own was to wait");
+  throw std::logic_error("waitOn() was called on a queue with a thread of its own");
 }
 
 void OwnThreadQueue::close() {
@@ -96,36 +95,37 @@ bool OwnThreadQueue::waitForEnd(std::chrono::steady_clock::time_point deadline) 
 
 void OwnThreadQueue::run() {
   setUpThread(label_, priorityFor(quality_));
-  const JobRunner::Scope scope(this, label_);
-  work();
+  const DispatchThread::Working working(this, label_);
+  work(DispatchThread::current());
   end();
 }
 
-void OwnThreadQueue::work() {
+void OwnThreadQueue::work(DispatchThread& thread) {
   const MutexLock lock(mutex_);
   while (waitForWork()) {
     hasWorker_ = true;
     while (takeBatch()) {
       mutex_.unlock();
-      while (canGoOn()) runNextInBatch();
-      BatchedTurns::current().end();
+      while (canGoOn()) runNextInBatch(thread);
+      thread.wakePool();
       mutex_.lock();
     }
     hasWorker_ = false;
   }
 }
 
-void OwnThreadQueue::runNextInBatch() {
-  BatchedTurns& turns = BatchedTurns::current();
+// Consecutive brief jobs wake the pool once. Before a job that may block, the pool is woken: the
+// job may wait for what an earlier one handed to the pool.
+void OwnThreadQueue::runNextInBatch(DispatchThread& thread) {
   if (batch_[next_].weight == JobWeight::kBrief) {
-    turns.begin();
+    thread.holdPool();
   } else {
-    turns.end();
+    thread.wakePool();
   }
   runNext();
 }
 
-// Destroys what was discarded in the middle of a batch, and tells that this was the last.
+// Discards what a stop left in the batch, and reports the end of the thread.
 void OwnThreadQueue::end() {
   if (next_ < batch_.size()) runner_->countDiscarded(batch_.size() - next_);
   batch_.clear();
@@ -134,7 +134,7 @@ void OwnThreadQueue::end() {
   ended_.notifyAll();
 }
 
-// Waits until there are jobs and nobody works on them; false when the thread should end.
+// Waits until there are jobs and no other worker. False when the thread should end.
 bool OwnThreadQueue::waitForWork() {
   while (hasWorker_ || !hasWork()) {
     if (!hasWorker_ && life_ != Life::kOpen) return false;
@@ -145,8 +145,8 @@ bool OwnThreadQueue::waitForWork() {
   return true;
 }
 
-std::size_t OwnThreadQueue::help(HelpingThread& helper, std::size_t limit) {
-  const JobRunner::Scope scope(this, label_);
+std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit) {
+  const DispatchThread::Working working(this, label_);
   std::size_t done = 0;
   bool mustWake = false;
   {
@@ -175,7 +175,8 @@ bool OwnThreadQueue::hasWork() const {
   return life_ != Life::kStopped && (!waiting_.empty() || next_ < batch_.size());
 }
 
-// Makes the worker's batch hold the next jobs; false when there are none to run.
+// Moves the waiting jobs into the batch, unless the batch has some left. False when there are none
+// to run.
 bool OwnThreadQueue::takeBatch() {
   if (!hasWork()) return false;
   if (next_ < batch_.size()) return true;
@@ -186,7 +187,7 @@ bool OwnThreadQueue::takeBatch() {
   return true;
 }
 
-// Whether the caller must notify the own thread: it sleeps and nobody else is about to wake it.
+// True when the caller must notify the own thread: it sleeps, and nobody else is waking it.
 bool OwnThreadQueue::takeWakeUp() { return std::exchange(sleeps_, false); }
 
 bool OwnThreadQueue::canGoOn() const {
@@ -194,24 +195,10 @@ bool OwnThreadQueue::canGoOn() const {
 }
 
 void OwnThreadQueue::runNext() {
-  // Taken out first, so that what the job holds goes as soon as it has run.
+  // Moved out first, so that what the job holds is released as soon as the job has run: a request's
+  // token must not wait for the end of the batch.
   const Job job = std::move(batch_[next_++].job);
   runner_->run(job);
-}
-
-HelpingThread& HelpingThread::current() {
-  static thread_local HelpingThread thread;
-  return thread;
-}
-
-void HelpingThread::end() {
-  std::size_t left = kHelpedJobsLimit;
-  for (std::size_t index = 0; index < queues_.size(); ++index) {
-    const std::shared_ptr<OwnThreadQueue> queue = std::move(queues_[index]);
-    left -= queue->help(*this, left);
-  }
-  queues_.clear();
-  isActive_ = false;
 }
 
 }  // namespace halvox::platform::linux_

@@ -36,7 +36,7 @@ bool PoolThreads::provide() {
       ++running_;
     }
   } catch (const std::system_error&) {
-    if (threads_.empty()) return false;  // one alone will do
+    if (threads_.empty()) return false;
   }
   areThere_.store(true, std::memory_order_relaxed);
   return true;

@@ -15,33 +15,35 @@
 
 namespace halvox::platform::linux_ {
 
-// The pool's threads of one quality of service, which run at its scheduling priority. Two of them,
-// so that one job that waits does not hold up all others. A thread stays at its priority for good:
-// lowering it needs no privilege, but raising it again does. So each quality has threads of its
-// own.
+// The pool's threads of one quality of service. There are two, so that one job that blocks does not
+// hold up all others. They keep the scheduling priority of their quality: lowering a thread's
+// priority needs no privilege, but raising it again does.
 //
-//   without threads --provide()--> serving --stop()--> stopped, waitForEnd() --> ended
+//   no threads --provide()--> running --stop()--> stopping --waitForEnd()--> ended
 //
-// Threads that have nothing to do sleep without a timer. Any thread may call. Belongs to the pool.
+// Idle threads sleep without a time-out. Owned by the pool. Any thread may call.
 class PoolThreads {
  public:
   explicit PoolThreads(QualityOfService quality) : quality_(quality) {}
   PoolThreads(const PoolThreads&) = delete;
   PoolThreads& operator=(const PoolThreads&) = delete;
-  // Waits for the jobs that run.
+  // Stops, and waits for the running jobs.
   ~PoolThreads();
 
-  // What they run; jobs that are added to it without threads stay there.
+  // Their run queue. What is posted before there are threads waits in it.
   [[nodiscard]] asio::io_context& context() { return context_; }
-  // Makes the threads unless they are there; false when the system has none to give. The calling
-  // thread must not be of a lower priority: new threads begin with that of their maker.
+  // Starts the threads unless they run. One is enough if the system refuses the second. False when
+  // it refuses both, and after stop(). The caller must not have a lower priority than this quality:
+  // a new thread starts with the priority of the thread that makes it.
   bool provide() HALVOX_EXCLUDES(mutex_);
 
-  // Lets the threads end after the jobs that run.
+  // Lets the threads end after the jobs that they run.
   void stop() HALVOX_EXCLUDES(mutex_);
-  // Waits for their end until that time; false when a job still runs then. After stop() only.
+  // Waits for the end of the threads, at most until that time. False when a job still runs then.
+  // Call after stop().
   bool waitForEnd(std::chrono::steady_clock::time_point deadline) HALVOX_EXCLUDES(mutex_);
-  // Lets the jobs see the stop that did not run. Call only after waitForEnd() has returned true.
+  // Runs what is left in the run queue; each entry sees the stop and discards its jobs. Call after
+  // waitForEnd() has returned true.
   void discardJobs();
 
  private:
@@ -53,7 +55,7 @@ class PoolThreads {
   const QualityOfService quality_;
   asio::io_context context_{static_cast<int>(kThreads)};
   asio::executor_work_guard<asio::io_context::executor_type> work_{context_.get_executor()};
-  std::atomic<bool> areThere_{false};  // orders with nothing: saves the lock
+  std::atomic<bool> areThere_{false};  // relaxed: it only saves the lock
   Mutex mutex_;
   Condition ended_;
   bool isStopped_ HALVOX_GUARDED_BY(mutex_) = false;

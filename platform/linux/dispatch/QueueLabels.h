@@ -11,26 +11,29 @@
 
 namespace halvox::platform::linux_ {
 
-// What the shared queues of one label have in common, for whoever looks for a queue that is stuck:
-// how many jobs were added to them and were run, and how many of them are at work right now.
+// What the shared queues with one label have in common. It is how a stuck queue is found: its label
+// counts more jobs added than run.
 struct QueueLabel {
   QueueLabel(Counter& addedJobs, Counter& ranJobs) : added(addedJobs), run(ranJobs) {}
 
-  std::string_view text{};  // owned by the labels
+  std::string_view text{};  // owned by the QueueLabels
   Counter& added;
   Counter& run;
-  std::atomic<int> atWork{0};  // orders with nothing: it is only looked at
+  // How many of the queues are having a turn. Relaxed: it is only read to name stuck queues.
+  std::atomic<int> atWork{0};
 };
 
-// The labels of the shared queues. There is one for each text, and texts are constants of the
-// code, so they are few. Owns the labels; any thread may call. `statistics` must outlive it.
+// The labels of the shared queues. One for each text. They are never removed: texts are constants
+// of the code, and all sessions share one. Owns the labels; belongs to the pool. Any thread may
+// call.
 class QueueLabels {
  public:
+  // `statistics` must outlive this.
   explicit QueueLabels(StatisticsService& statistics) : statistics_(statistics) {}
 
-  // The label of that text, made at the first call; lives as long as this.
+  // The label with that text, made at the first call. Valid as long as this object.
   QueueLabel& label(std::string_view text) HALVOX_EXCLUDES(mutex_);
-  // The texts of those whose queues are at work.
+  // The texts of the labels with a queue that is having a turn.
   [[nodiscard]] std::vector<std::string> atWork() HALVOX_EXCLUDES(mutex_);
 
  private:

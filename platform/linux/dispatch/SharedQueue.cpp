@@ -5,13 +5,12 @@
 
 #include <asio/post.hpp>
 
-#include "platform/linux/dispatch/BatchedTurns.h"
 #include "platform/linux/dispatch/DispatchPool.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
-// Shows a queue as being at work for a scope.
+// Counts a queue as having a turn while it lives.
 class AtWork {
  public:
   explicit AtWork(QueueLabel& label) : label_(label) {
@@ -47,12 +46,13 @@ void SharedQueue::async(JobWeight /*weight*/, Job job) {
 void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
                          std::optional<std::chrono::nanoseconds> timeout,
                          std::function<void(WaitOutcome)> then) {
-  if (!isCurrent()) throw std::logic_error("a wait began outside the jobs of its queue");
+  if (!isCurrent()) throw std::logic_error("waitOn() was called outside the jobs of its queue");
   auto shared = std::dynamic_pointer_cast<SharedSemaphore>(std::move(semaphore));
-  if (shared == nullptr) throw std::logic_error("a semaphore of another service");
+  if (shared == nullptr)
+    throw std::logic_error("waitOn() needs a semaphore of its queue's service");
   {
     const MutexLock lock(mutex_);
-    if (isWaiting_) throw std::logic_error("a job began a second wait");
+    if (isWaiting_) throw std::logic_error("a job called waitOn() a second time");
     isWaiting_ = true;
   }
   pool_->waits().begin(shared_from_this(), shared, timeout, std::move(then));
@@ -64,7 +64,7 @@ void SharedQueue::resume(Job then) {
     jobs_.push_front(std::move(then));
     label_.added.add();
     isWaiting_ = false;
-    // The job that began the wait may not have returned yet.
+    // The job that began the wait may not have returned yet. Its turn then runs `then`.
     if (hasTurn_) return;
     hasTurn_ = true;
     pool_->beginTurn();
@@ -73,8 +73,8 @@ void SharedQueue::resume(Job then) {
 }
 
 void SharedQueue::askForTurn() {
-  BatchedTurns& turns = BatchedTurns::current();
-  if (turns.isActive()) return turns.note(shared_from_this());
+  DispatchThread& thread = DispatchThread::current();
+  if (thread.isHoldingPool()) return thread.noteTurn(shared_from_this());
   beginTurn();
 }
 
@@ -84,7 +84,7 @@ void SharedQueue::beginTurn() {
 }
 
 void SharedQueue::runTurn() {
-  const JobRunner::Scope scope(this, label_.text);
+  const DispatchThread::Working working(this, label_.text);
   const AtWork atWork(label_);
   for (int ran = 0; ran < kJobsPerTurn; ++ran) {
     if (pool_->isStopped()) return discardJobs();
@@ -93,7 +93,7 @@ void SharedQueue::runTurn() {
   beginTurn();
 }
 
-// False when there is nothing to run; the turn has ended then.
+// False when there is nothing to run. The turn has then ended.
 bool SharedQueue::runNext() {
   Job job;
   {

@@ -9,44 +9,49 @@
 
 #include "platform/dispatch.h"
 #include "platform/linux/base/Mutex.h"
-#include "platform/linux/dispatch/JobRunner.h"
+#include "platform/linux/dispatch/DispatchThread.h"
 #include "platform/linux/dispatch/QueueLabels.h"
 
 namespace halvox::platform::linux_ {
 
 class DispatchPool;
 
-// A serial queue on the pool, whose jobs can wait on semaphores. Takes turns on the pool's threads
-// of its quality:
+// A serial queue without a thread of its own. It takes turns on the pool's threads of its quality
+// of service, and its jobs can wait on semaphores without holding a thread:
 //
-//   idle --a job comes--> has a turn --no job is left--> idle
-//                            |    ^
-//           a job began a wait    resume()
-//                            v    |
-//                           waiting
+//   idle --async()--> has a turn --no job is left--> idle
+//                        |    ^
+//    a job called waitOn()    resume()
+//                        v    |
+//                       waiting
 //
-// Shared by its holders, its turn and its wait.
+// A turn is one entry in the pool's run queue, however many jobs the queue has. At most one turn
+// exists at a time, which is what makes the queue serial.
+// Shared by its holders, its turn and its wait. Any thread may add jobs. The number of jobs has no
+// bound: what sessions add is charged to clients. Jobs added after the pool has stopped are
+// discarded and counted.
 class SharedQueue final : public DispatchQueue, public std::enable_shared_from_this<SharedQueue> {
  public:
   SharedQueue(std::shared_ptr<DispatchPool> pool, std::string_view label, QualityOfService quality);
 
+  // The weight does not matter here: pool threads may block.
   void async(JobWeight weight, Job job) override;
   // Throws std::logic_error, which fails the job, when called outside the jobs of the queue, twice
-  // by one, or with a semaphore of another service.
+  // by one job, or with a semaphore of another service.
   void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
               std::optional<std::chrono::nanoseconds> timeout,
               std::function<void(WaitOutcome)> then) override;
-  [[nodiscard]] bool isCurrent() const override { return JobRunner::isCurrent(this); }
+  [[nodiscard]] bool isCurrent() const override { return DispatchThread::current().worksFor(this); }
 
-  // Ends the wait: the queue goes on with this job, then with those that came meanwhile.
+  // Ends the wait: the queue continues with this job, then with those that were added meanwhile.
   void resume(Job then);
-  // Lets the pool run the jobs of the turn that is to come.
+  // Puts the turn that was asked for into the pool's run queue.
   void beginTurn();
-  // Discards and counts the jobs that wait. When the pool has stopped.
+  // Discards and counts the jobs. Call after the pool has stopped.
   void discardJobs();
 
  private:
-  // The jobs that one turn runs before other queues get theirs.
+  // How many jobs one turn runs before other queues get theirs.
   static constexpr int kJobsPerTurn = 64;
 
   void askForTurn();
@@ -58,7 +63,7 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
   const QualityOfService quality_;
   Mutex mutex_;
   std::deque<Job> jobs_ HALVOX_GUARDED_BY(mutex_);
-  bool hasTurn_ HALVOX_GUARDED_BY(mutex_) = false;  // one is to come or under way
+  bool hasTurn_ HALVOX_GUARDED_BY(mutex_) = false;  // a turn is noted, in the run queue or running
   bool isWaiting_ HALVOX_GUARDED_BY(mutex_) = false;
 };
 

@@ -16,7 +16,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-class BatchedTurnsTest : public ::testing::Test {
+class HoldingTest : public ::testing::Test {
  protected:
   std::shared_ptr<DispatchQueue> createQueue(QueueThreading threading) {
     return service_.createSerialQueue("q", QualityOfService::kUtility, threading);
@@ -45,7 +45,7 @@ class BatchedTurnsTest : public ::testing::Test {
   AsioDispatchService service_{log_, statistics_};
 };
 
-TEST_F(BatchedTurnsTest, JobsRunWhenThePoolIsNotHeldAnyMore) {
+TEST_F(HoldingTest, JobsRunWhenThePoolIsNotHeldAnyMore) {
   const auto queue = createQueue(QueueThreading::kShared);
   std::atomic<int> ran = 0;
 
@@ -59,7 +59,7 @@ TEST_F(BatchedTurnsTest, JobsRunWhenThePoolIsNotHeldAnyMore) {
   EXPECT_TRUE(eventually([&ran] { return ran == 2; }));
 }
 
-TEST_F(BatchedTurnsTest, JobsThatHelpedJobsHandOnWakeThePoolToo) {
+TEST_F(HoldingTest, JobsThatHelpedJobsHandOnWakeThePoolToo) {
   const auto own = createQueue(QueueThreading::kOwnThread);
   const auto shared = createQueue(QueueThreading::kShared);
   std::promise<void> done;
@@ -76,7 +76,7 @@ TEST_F(BatchedTurnsTest, JobsThatHelpedJobsHandOnWakeThePoolToo) {
   EXPECT_TRUE(isSet(ran));
 }
 
-TEST_F(BatchedTurnsTest, AJobRunsAtOnceWhenThePoolIsNotHeld) {
+TEST_F(HoldingTest, AJobRunsAtOnceWhenThePoolIsNotHeld) {
   const auto queue = createQueue(QueueThreading::kShared);
   std::promise<void> done;
   auto ran = done.get_future();
@@ -88,7 +88,7 @@ TEST_F(BatchedTurnsTest, AJobRunsAtOnceWhenThePoolIsNotHeld) {
   EXPECT_TRUE(isSet(ran));
 }
 
-TEST_F(BatchedTurnsTest, AJobThatMayBlockCanWaitForWhatAnEarlierOneHandedOn) {
+TEST_F(HoldingTest, AJobThatMayBlockCanWaitForWhatAnEarlierOneHandedOn) {
   const auto own = createQueue(QueueThreading::kOwnThread);
   const auto shared = createQueue(QueueThreading::kShared);
   std::promise<void> go;
@@ -106,7 +106,7 @@ TEST_F(BatchedTurnsTest, AJobThatMayBlockCanWaitForWhatAnEarlierOneHandedOn) {
   EXPECT_TRUE(waited.get_future().get());
 }
 
-TEST_F(BatchedTurnsTest, AJobThatMayBlockCanWaitForWhatItHandsOn) {
+TEST_F(HoldingTest, AJobThatMayBlockCanWaitForWhatItHandsOn) {
   const auto own = createQueue(QueueThreading::kOwnThread);
   const auto shared = createQueue(QueueThreading::kShared);
   std::promise<bool> waited;
@@ -121,7 +121,7 @@ TEST_F(BatchedTurnsTest, AJobThatMayBlockCanWaitForWhatItHandsOn) {
   EXPECT_TRUE(waited.get_future().get());
 }
 
-TEST_F(BatchedTurnsTest, ABatchThatEndsAfterTheStopDiscardsItsJobs) {
+TEST_F(HoldingTest, ABatchThatEndsAfterTheStopDiscardsItsJobs) {
   const auto queue = createQueue(QueueThreading::kShared);
   std::atomic<bool> ran = false;
 

@@ -1,0 +1,45 @@
+#include "platform/linux/dispatch/DispatchThread.h"
+
+#include <cstddef>
+
+#include "platform/linux/dispatch/OwnThreadQueue.h"
+#include "platform/linux/dispatch/SharedQueue.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// How many jobs one endHelping() runs before it leaves the others to the queues' own threads.
+// Helped jobs can add jobs; without a bound the I/O thread might never read a socket again. It is
+// far above what one turn of the loop delivers to a few clients, 64 requests each.
+constexpr std::size_t kHelpedJobsLimit = 1000;
+
+}  // namespace
+
+DispatchThread& DispatchThread::current() {
+  static thread_local DispatchThread thread;
+  return thread;
+}
+
+DispatchThread::~DispatchThread() {
+  endHelping();
+  wakePool();
+}
+
+void DispatchThread::endHelping() {
+  std::size_t left = kHelpedJobsLimit;
+  // By index: helped jobs can note further queues, which moves the elements.
+  for (std::size_t index = 0; index < queuesToHelp_.size(); ++index) {
+    const std::shared_ptr<OwnThreadQueue> queue = std::move(queuesToHelp_[index]);
+    left -= queue->help(*this, left);
+  }
+  queuesToHelp_.clear();
+  isHelping_ = false;
+}
+
+void DispatchThread::wakePool() {
+  isHoldingPool_ = false;
+  for (const std::shared_ptr<SharedQueue>& queue : turns_) queue->beginTurn();
+  turns_.clear();
+}
+
+}  // namespace halvox::platform::linux_
