@@ -39,9 +39,10 @@ BENCHMARK(readHeader);
 void readAndDecodeTenFields(benchmark::State& state) {
   const std::string bytes = sendMessageFrame(state.range(0) == 1);
   std::vector<Value> arguments;
+  DecodeScratch scratch;
   for (auto _ : state) {
     const auto result = readFrame(asBytes(bytes));
-    const auto error = decodeBody(std::get<Frame>(result), "a{sv}uqaax", arguments);
+    const auto error = decodeBody(std::get<Frame>(result), "a{sv}uqaax", arguments, scratch);
     if (error.has_value()) state.SkipWithError(error->message.c_str());
     benchmark::DoNotOptimize(arguments.data());
   }

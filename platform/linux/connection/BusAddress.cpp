@@ -7,7 +7,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Takes the part up to the separator off the front of `text`.
+// Removes the part up to the separator from the front of `text`, and returns it.
 std::string_view takePart(std::string_view& text, char separator) {
   const std::size_t end = text.find(separator);
   const std::string_view part = text.substr(0, end);
@@ -15,7 +15,7 @@ std::string_view takePart(std::string_view& text, char separator) {
   return part;
 }
 
-// A value with its %XX escapes resolved; none when one of them is broken.
+// The value with its %XX escapes decoded; none if an escape is malformed.
 std::optional<std::string> unescaped(std::string_view value) {
   std::string result;
   while (!value.empty()) {

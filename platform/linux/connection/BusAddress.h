@@ -17,22 +17,23 @@ struct BusSocket {
   friend bool operator==(const BusSocket&, const BusSocket&) = default;
 };
 
-// The Unix sockets that a D-Bus address list names, in its order. Entries of other transports and
-// entries that make no sense are left out.
+// The Unix sockets in a D-Bus address list, in the order of the list. Skips entries of other
+// transports and malformed entries.
 std::vector<BusSocket> parseBusAddress(std::string_view addresses);
 
-// The address of a bus, from the environment or the usual place.
+// The address of a bus: from the environment, else the default one. Empty for no bus, and for a
+// session bus when the environment does not name one.
 std::string busAddressOf(BusKind bus);
 
 // The bus that started a process.
 struct StarterBus {
-  BusKind kind = BusKind::kNone;  // kNone: neither of the usual ones
+  BusKind kind = BusKind::kNone;  // kNone: neither the session bus nor the system bus
   std::string address;
   friend bool operator==(const StarterBus&, const StarterBus&) = default;
 };
 
-// The bus that started this process, which it says in the environment; none when none did. A unit
-// that starts the service in the place of a bus may name the kind alone.
+// The bus that started this process, as it says in the environment; none if no bus did. A systemd
+// unit that starts the service on behalf of a bus may set the kind without the address.
 std::optional<StarterBus> starterBus();
 
 }  // namespace halvox::platform::linux_

@@ -16,8 +16,8 @@ namespace {
 
 constexpr UnitLog kLog{connectionCategory, "BusConnection"};
 
-// What the bus answers about a sender; unknown for what it does not tell, as about a sender that
-// has gone.
+// The credentials in the bus's answer. What the bus does not say stays unknown; about a sender that
+// has left, it says nothing.
 PeerCredentials credentialsIn(const dbus::Frame& answer) {
   std::vector<Value> values;
   if (answer.header.type != dbus::MessageType::kMethodReturn ||
@@ -67,7 +67,7 @@ void BusConnection::onReadable() {
   const SocketStream::Read read = stream_.read();
   handleFrames();
   stream_.input().settle();
-  if (read == SocketStream::Read::kEnded) lose("it closed the connection");
+  if (read == SocketStream::Read::kEnded) lose("the bus closed the connection");
 }
 
 void BusConnection::onOutputProgress() {
@@ -90,7 +90,8 @@ void BusConnection::handleFrames() {
   for (const std::shared_ptr<BusSender>& sender : std::exchange(touched_, {})) {
     sender->deliverReceived();
   }
-  // The bus takes what it is sent in its own time; until then nothing more is asked of us.
+  // The bus reads our replies at its own pace. Until it does, do not read more requests, since each
+  // adds a reply.
   if (stream_.output().unsentBytes() >= kMaxUnreadReplyBytes) stream_.setReading(false);
 }
 
@@ -132,7 +133,7 @@ void BusConnection::handleSignal(const dbus::Frame& frame) {
   std::vector<Value> names;  // the name, its old owner, its new one
   if (dbus::decodeBody(frame, "sss", names).has_value() || !names[2].string().empty()) return;
   const auto found = senders_.find(names[0].string());
-  // Held while it ends: its end may make us forget it.
+  // A copy of the pointer keeps it alive: its end can remove it from the map.
   if (found != senders_.end()) std::shared_ptr(found->second)->onVanished();
 }
 
@@ -165,8 +166,8 @@ std::shared_ptr<BusSender> BusConnection::senderNamed(std::string_view name) {
 
 void BusConnection::lose(const std::string& why) {
   if (std::exchange(lost_, true)) return;
-  kLog.error("lost the bus: ", why, "; its ", senders_.size(),
-             " clients are gone, the socket is served on");
+  kLog.error("lost the bus: ", why, "; disconnecting its ", senders_.size(),
+             " clients and serving the socket only");
   stream_.setReading(false);
   const auto senders = senders_;
   for (const auto& [name, sender] : senders) sender->onBusLost();

@@ -20,9 +20,13 @@ namespace halvox::platform::linux_ {
 class BusSender;
 class ConnectionHost;
 
-// Our connection to a bus: hands each sender's requests to a BusSender of its own, and asks the bus
-// who the sender is. Belongs to the I/O thread.
-// When the bus is lost all senders end, with an error line, and it is not connected to again.
+// The service's connection to a bus. Gives each sender on the bus a BusSender, asks the bus for the
+// sender's credentials, and hands it the sender's requests.
+//
+//   started --the bus closes or breaks the rules--> lost: all senders end, an error is logged
+//
+// A lost bus is not joined again before the next start of the service: the bus has released our
+// name by then, and another process may have it. Belongs to the I/O thread. Owned by the host.
 class BusConnection final : private StreamOwner {
  public:
   // Does not own the host, which must outlive this.
@@ -32,10 +36,10 @@ class BusConnection final : private StreamOwner {
   ~BusConnection() override;
 
   void start();
-  // Lets go of all senders without their handlers: the service itself ends.
+  // Releases all senders without calling their handlers, because the service ends.
   void abandon();
 
-  // For senders.
+  // For senders. A sender that waits is told when the stream has room again.
   [[nodiscard]] SocketStream& stream() { return stream_; }
   void forget(const BusSender& sender);
   void noteWaitingSender() { someSenderWaits_ = true; }
@@ -55,7 +59,7 @@ class BusConnection final : private StreamOwner {
   SocketStream stream_;
   std::map<std::string, std::shared_ptr<BusSender>, std::less<>> senders_;
   std::unordered_map<std::uint32_t, std::weak_ptr<BusSender>> questions_;  // by serial
-  std::vector<std::shared_ptr<BusSender>> touched_;  // senders with new requests in this read
+  std::vector<std::shared_ptr<BusSender>> touched_;  // have received requests from this read
   bool someSenderWaits_ = false;
   bool lost_ = false;
 };

@@ -20,22 +20,25 @@ namespace {
 
 using Kind = ConnectionOpenError::Kind;
 
+// A local bus answers within milliseconds. The start of the service must not hang on a broken one.
 constexpr std::chrono::seconds kBusTimeout{5};
-constexpr std::uint32_t kDoNotQueue = 4;    // a flag of RequestName
+constexpr std::uint32_t kDoNotQueue = 4;    // flag of RequestName: fail if the name is taken
 constexpr std::uint32_t kPrimaryOwner = 1;  // answers of RequestName
 constexpr std::uint32_t kAlreadyOwner = 4;
+// Matches the signal for every name that loses its owner: `arg2` is the new owner, empty for none.
 constexpr std::string_view kVanishingNames =
     "type='signal',sender='org.freedesktop.DBus',interface='org.freedesktop.DBus',"
     "member='NameOwnerChanged',path='/org/freedesktop/DBus',arg2=''";
 
-// A connected socket, or an error number.
+// A connected socket, or an errno value.
 std::variant<UniqueFd, int> connectTo(const BusSocket& bus) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   const std::size_t start = bus.space == BusSocket::Space::kAbstract ? 1 : 0;
   if (bus.name.size() + start >= sizeof address.sun_path) return ENAMETOOLONG;
   std::memcpy(&address.sun_path[start], bus.name.data(), bus.name.size());
-  // An abstract name ends with the address, the path of a file with a NUL.
+  // The length marks the end of an abstract name; a file path ends with a NUL. Either way it takes
+  // one byte more than the name.
   const std::size_t length = offsetof(sockaddr_un, sun_path) + bus.name.size() + 1;
   UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
   if (!fd) return errno;
@@ -75,7 +78,10 @@ BusConnector::Failure BusConnector::connectToFirst(const std::string& address) {
     reasons +=
         (reasons.empty() ? "" : "; ") + socket.name + ": " + errnoText(std::get<int>(result));
   }
-  return unreachable(reasons.empty() ? "the address names no Unix socket" : reasons);
+  return unreachable(
+      reasons.empty()
+          ? "the address does not contain a Unix socket (unix:path=... or unix:abstract=...)"
+          : reasons);
 }
 
 BusConnector::Failure BusConnector::authenticate() {
@@ -105,9 +111,10 @@ BusConnector::Failure BusConnector::requestName() {
   return call("RequestName", "su", arguments, "u", [this](const Value& answer) -> Failure {
     const std::uint64_t owner = answer.toUInt64();
     if (owner == kPrimaryOwner || owner == kAlreadyOwner) return std::nullopt;
-    return ConnectionOpenError{
-        .kind = Kind::kBusNameTaken,
-        .description = "bus " + address_ + ": the name " + busName_ + " has another owner"};
+    return ConnectionOpenError{.kind = Kind::kBusNameTaken,
+                               .description = "bus " + address_ +
+                                              ": another process owns the name " + busName_ +
+                                              "; stop it, or leave this bus out of listener.bus"};
   });
 }
 
@@ -121,7 +128,7 @@ BusConnector::Failure BusConnector::call(std::string_view member, std::string_vi
                                 .member = member};
   std::string bytes;
   if (!dbus::appendMethodCall(bytes, ++lastSerial_, target, signature, arguments)) {
-    return unreachable("a call of " + std::string(member) + " cannot be written");
+    return unreachable("cannot encode the call of " + std::string(member));
   }
   if (Failure failure = send(bytes)) return failure;
   std::variant<dbus::Frame, ConnectionOpenError> answer = waitForAnswer(lastSerial_);
@@ -130,12 +137,13 @@ BusConnector::Failure BusConnector::call(std::string_view member, std::string_vi
   }
   const dbus::Frame& frame = std::get<dbus::Frame>(answer);
   if (frame.header.type == dbus::MessageType::kError) {
-    return unreachable(std::string(member) +
-                       " was refused: " + std::string(frame.header.errorName));
+    return unreachable(std::string(member) + " failed with " + std::string(frame.header.errorName));
   }
   std::vector<Value> values;
   if (dbus::decodeBody(frame, answerSignature, values).has_value()) {
-    return unreachable("the answer to " + std::string(member) + " makes no sense");
+    return unreachable("the answer to " + std::string(member) + " has the signature \"" +
+                       std::string(frame.header.signature) + "\", expected \"" +
+                       std::string(answerSignature) + "\"");
   }
   return take(values.empty() ? Value() : values.front());
 }
@@ -169,19 +177,19 @@ BusConnector::Failure BusConnector::send(std::string_view bytes) {
     } else if (errno != EAGAIN && errno != EINTR) {
       return unreachable(errnoText(errno));
     } else if (!waitFor(POLLOUT)) {
-      return unreachable("it does not answer in time");
+      return unreachable("no answer within 5 seconds");
     }
   }
   return std::nullopt;
 }
 
 BusConnector::Failure BusConnector::receive() {
-  if (!waitFor(POLLIN)) return unreachable("it does not answer in time");
+  if (!waitFor(POLLIN)) return unreachable("no answer within 5 seconds");
   const std::span<std::byte> room = input_.readInto(scratch_);
   const ssize_t count = read(fd_.get(), room.data(), room.size());
   const int error = errno;
   input_.received(count > 0 ? static_cast<std::size_t>(count) : 0);
-  if (count == 0) return unreachable("it closed the connection");
+  if (count == 0) return unreachable("the bus closed the connection");
   if (count < 0 && error != EAGAIN && error != EINTR) return unreachable(errnoText(error));
   return std::nullopt;
 }

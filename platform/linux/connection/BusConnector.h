@@ -20,15 +20,16 @@
 
 namespace halvox::platform::linux_ {
 
-// A bus on which we have our name.
+// A connection to a bus on which the service owns its name.
 struct BusSession {
-  UniqueFd fd;                    // does not block
-  std::vector<std::byte> unused;  // messages that came meanwhile
+  UniqueFd fd;                    // non-blocking
+  std::vector<std::byte> unused;  // messages that arrived before the answers, to be handled next
   std::uint32_t lastSerial = 0;
 };
 
-// Connects to the bus of an address, once: handshake, Hello, the name, and a match for names that
-// vanish. Waits for the bus, but no longer than kBusTimeout in all.
+// Connects to a bus: the handshake, Hello, a match rule for senders that leave, and the service's
+// name. One object connects once. Blocks the calling thread, at most for kBusTimeout (5 s) in all;
+// only used before the service serves anybody. A failure names the address and the reason.
 class BusConnector {
  public:
   explicit BusConnector(std::string busName);
@@ -43,11 +44,11 @@ class BusConnector {
   Failure connectToFirst(const std::string& address);
   Failure authenticate();
   Failure requestName();
-  // Calls a method of the bus; `take` gets the arguments of the answer.
+  // Calls a method of the bus and passes the first argument of the answer to `take`.
   Failure call(std::string_view member, std::string_view signature,
                std::span<const Value> arguments, std::string_view answerSignature,
                const std::function<Failure(const Value&)>& take);
-  // The answer to call number `serial`, or none when it did not come; other messages are kept.
+  // Waits for the answer to the call with that serial. Keeps all other messages for the session.
   std::variant<dbus::Frame, ConnectionOpenError> waitForAnswer(std::uint32_t serial);
   Failure send(std::string_view bytes);
   Failure receive();

@@ -2,7 +2,7 @@
 
 #include <string_view>
 
-// The bus itself, as its clients see it.
+// The names under which clients address the bus itself.
 namespace halvox::platform::linux_::bus_names {
 
 inline constexpr std::string_view kBus = "org.freedesktop.DBus";  // its name and its interface

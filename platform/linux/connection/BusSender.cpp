@@ -36,7 +36,8 @@ void BusSender::receive(const dbus::MessageHeader& header, std::span<const std::
   }
   host().statistics().requestsReceived.add();
   refuse(header, Refusal::kTooManyWaiting, error_names::kLimitsExceeded,
-         std::to_string(waiting) + " bytes of earlier requests are still waiting");
+         std::to_string(waiting) + " bytes of earlier requests are waiting, the limit is " +
+             std::to_string(kMaxWaitingBytesOfSender) + "; wait for replies before sending more");
 }
 
 void BusSender::receiveOversized(const FrameBuffer::Next& next) { refuseOversized(next); }
@@ -60,7 +61,7 @@ void BusSender::onVanished() {
 }
 
 void BusSender::onBusLost() {
-  // A sender that the delegate has not heard of has no handlers to be called.
+  // The delegate has not been asked about an unknown sender, so it has no handlers to call.
   isKnown_ ? end(Why::kPeerVanished) : abandon();
 }
 
@@ -76,10 +77,10 @@ void BusSender::onDelivered(bool /*begun*/, bool /*progress*/) {
 
 void BusSender::onFinished() { bus_.forget(*this); }
 
-// The bus passes on nothing that breaks the rules of the wire, so this is one bad request among
-// good ones; the connection is that of all senders.
+// Does not close the connection, because all senders share it, and because the bus forwards valid
+// frames only: this one request is bad, and the stream is not.
 void BusSender::onMalformed(const std::string& what) {
-  kLog.error("dropped a message of ", description(), ": it is no D-Bus message: ", what);
+  kLog.error("dropped a message of ", description(), ": not a valid D-Bus message: ", what);
   host().statistics().connectionsMalformed.add();
 }
 

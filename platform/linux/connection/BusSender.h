@@ -11,11 +11,17 @@ namespace halvox::platform::linux_ {
 
 class BusConnection;
 
-// One sender on the bus, a connection of its own. Its requests come through the bus's connection
-// and wait here until the bus has said who the sender is and while the sender is held back. The
-// bus cannot be asked to hold one sender back, so what goes beyond kMaxWaitingBytesOfSender is
-// refused; what the sender does not read of its answers is kept, and bounded, by the bus.
-// A sender that is gone before the bus could say who it is is served as process 0 of no user.
+// One sender on the bus. Each counts as a connection of its own.
+//
+//   unknown --credentials, or the handshake timeout--> known: the delegate is asked, requests are
+//       delivered --the name vanishes--> ended
+//
+// Its requests arrive on the bus's connection. They wait here until the bus has said who the sender
+// is, and while flow control holds the sender back. The bus cannot be asked to hold one sender
+// back, so requests beyond kMaxWaitingBytesOfSender are refused. Replies that the sender does not
+// read are kept and bounded by the bus. A sender that left before the bus could answer is served as
+// process 0 of an unknown user: its requests were sent, and some need no reply. Belongs to the I/O
+// thread. Shared by the bus's connection and the delegate.
 class BusSender final : public ClientConnection, private DeadlineOwner {
  public:
   BusSender(ConnectionHost& host, BusConnection& bus, std::string name);
@@ -24,17 +30,18 @@ class BusSender final : public ClientConnection, private DeadlineOwner {
   [[nodiscard]] bool isPeerToPeer() const override { return false; }
   [[nodiscard]] const std::string& name() const { return name_; }
 
-  // One whole request, or the header of one that is too large.
+  // A whole request.
   void receive(const dbus::MessageHeader& header, std::span<const std::byte> frame);
+  // The header of a request that is larger than the limit.
   void receiveOversized(const FrameBuffer::Next& next);
-  // Delivers what has been received, unless the sender has to wait.
+  // Delivers what has been received, unless flow control holds the sender back.
   void deliverReceived();
-  // The bus has said who the sender is, as far as it knows.
+  // The bus has answered who the sender is, or has not answered in time.
   void onCredentials(const PeerCredentials& credentials);
-  // The bus says that nobody has the name any more.
+  // The bus says that the name has no owner any more.
   void onVanished();
   void onBusLost();
-  // The bus has taken some of what it is sent.
+  // The bus has read some of the replies.
   void onStreamRoom() { onOutputRoom(); }
 
  private:

@@ -52,6 +52,8 @@ void ClientConnection::deliver() {
   if (state_ == State::kNotResumed) setReading(false);
   if (state_ == State::kNotResumed || state_ == State::kEnded) return input().settle();
   state_ = State::kReading;
+  // While the store is behind, a client that has more than a short share waits until the store has
+  // caught up. Clients that send little are not slowed down.
   const bool pressed = host_.backpressure().isHigh();
   std::size_t requestsLeft = pressed ? kShortTurnRequests : host_.turn().requestsPerClient();
   std::size_t bytes = 0;
@@ -93,7 +95,8 @@ ClientConnection::Step ClientConnection::deliverFrame(const FrameBuffer::Next& n
   return hasEnded() ? Step::kStop : Step::kGoOn;
 }
 
-// The header is read as that of a message without a body; what follows is skipped as it comes.
+// Reads the header alone, as that of a message without a body, to learn whom to answer. The body is
+// dropped as it arrives and never held in memory.
 void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
   const std::vector<std::byte> header = FrameBuffer::withoutBody(next);
   const std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(header);
@@ -104,7 +107,7 @@ void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
   if (request.type != dbus::MessageType::kMethodCall) return;
   host_.statistics().requestsReceived.add();
   refuse(request, Refusal::kTooLarge, error_names::kLimitsExceeded,
-         "a message of " + std::to_string(next.totalBytes) + " bytes is larger than the limit of " +
+         "the message has " + std::to_string(next.totalBytes) + " bytes, the limit is " +
              std::to_string(host_.options().maxFrameBytes));
 }
 
@@ -160,7 +163,8 @@ void ClientConnection::finish() {
   if (why_ == Why::kPeerVanished && interruptionHandler_) interruptionHandler_();
   if (invalidationHandler_) invalidationHandler_();
   if (unloggedRefusals_ > 0) {
-    kLog.notice("refused ", unloggedRefusals_, " more requests of ", description());
+    kLog.notice("refused ", unloggedRefusals_, " more requests of ", description(),
+                " for the same reasons");
   }
   host_.statistics().connectionsEnded.add();
   letGo();
@@ -190,9 +194,11 @@ void ClientConnection::sendReturn(std::uint32_t serial, std::string_view signatu
   const dbus::ReplyTo replyTo{.serial = serial, .destination = replyDestination()};
   if (!dbus::appendMethodReturn(out.output().bytes(), replyTo, out.nextSerial(), signature,
                                 value)) {
-    kLog.error("the answer to request ", serial, " of ", description(),
-               " does not have the signature ", std::string(signature));
-    sendError(serial, error_names::kFailed, "the answer has no form on the wire");
+    kLog.error("cannot encode the answer to request ", serial, " of ", description(),
+               " with the signature \"", std::string(signature), "\"; sending an error");
+    sendError(serial, error_names::kFailed,
+              "the service cannot encode its answer with the signature \"" +
+                  std::string(signature) + "\"");
     return;
   }
   out.output().frameAppended();
@@ -212,7 +218,7 @@ void ClientConnection::sendError(std::uint32_t serial, std::string_view name,
   std::string& bytes = out.output().bytes();
   if (!dbus::appendError(bytes, replyTo, out.nextSerial(), name, text) &&
       !dbus::appendError(bytes, replyTo, out.nextSerial(), error_names::kFailed,
-                         "an error that has no form on the wire")) {
+                         "the service cannot encode the error that it answers")) {
     return;
   }
   out.output().frameAppended();
@@ -235,7 +241,7 @@ void ClientConnection::refuse(const dbus::MessageHeader& request, Refusal reason
 }
 
 void ClientConnection::onMalformed(const std::string& what) {
-  kLog.error("closing ", description(), ": what it sent is no D-Bus message: ", what);
+  kLog.error("disconnecting ", description(), ": not a valid D-Bus message: ", what);
   host_.statistics().connectionsMalformed.add();
   end(Why::kClosedHere);
 }

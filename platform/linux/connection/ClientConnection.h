@@ -19,23 +19,27 @@ namespace halvox::platform::linux_ {
 
 class ConnectionHost;
 
-// One client: delivers the requests that are in its input buffer, as fast as the bounds allow, and
-// answers them. Where the bytes come from is up to the subclasses.
+// One client: delivers the requests in its input buffer as fast as the bounds allow, and sends the
+// replies. Subclasses provide the bytes.
 //
-//   waiting to be resumed ──resume()──► reading ◄──► due (more than its share: next turn)
-//                                        │  ▲──────► waiting for room, for the peer to read, or for
-//                                        │           a consumer to catch up
-//                                        └─────────► ended ──next turn──► finished
+//   not resumed ──resume()──► reading ◄──► due: had more than its share, continues in the next turn
+//                               │  ▲
+//                               │  └─────► waiting for one of three things, not read from:
+//                               │            room: half of its open requests are carried out
+//                               │            its reader: the client has read half of its replies
+//                               │            relief: the store has caught up
+//                               └────────► ended ──next turn──► finished
 //
-// Belongs to the I/O thread. Shared by the host, by the lists of its turn and by the delegate.
-// A client that breaks the rules of the wire is closed with an error line; requests that make no
-// sense are answered with an error, and logged once a client and kind.
+// Belongs to the I/O thread. Shared by the host, the lists of the turn and the delegate.
+// A client that breaks the rules of the wire is disconnected, with an error in the log. A request
+// that is valid on the wire but wrong is answered with an error, and the first of each kind is
+// logged: a client in a loop must not fill the log.
 class ClientConnection : public NSXPCConnection,
                          public std::enable_shared_from_this<ClientConnection> {
  public:
   enum class Why : std::uint8_t { kPeerVanished, kClosedHere };
 
-  // Does not own the host, which must outlive the connection's end.
+  // Does not own the host, which must exist until the connection has finished or was abandoned.
   ClientConnection(ConnectionHost& host, std::uint64_t number, const PeerCredentials& credentials);
   ClientConnection(const ClientConnection&) = delete;
   ClientConnection& operator=(const ClientConnection&) = delete;
@@ -48,20 +52,22 @@ class ClientConnection : public NSXPCConnection,
   void setInvalidationHandler(std::function<void()> handler) override;
   void resume() override;
 
-  // Delivers what is there, within this turn's share.
+  // Delivers the requests that have arrived, at most this turn's share.
   void deliver();
-  // There is room for more requests.
+  // Half of the open requests have been carried out.
   void onRoom();
-  // The consumer that was behind has caught up.
+  // The store has caught up.
   void onRelief();
-  // Ends the connection: nothing is read from it any more. The rest follows in finish().
+  // Ends the connection: nothing more is read. finish() follows in the next turn, after the last
+  // replies have been written.
   void end(Why why);
-  // Runs the handlers and lets go of everything. By the schedule, after the last replies.
+  // Calls the handlers and releases everything. Called by the schedule.
   void finish();
-  // Lets go without the handlers: the connection was refused, or the service itself ends.
+  // Releases everything without calling the handlers: the delegate refused the connection, or the
+  // service ends.
   void abandon();
 
-  // For whoever answers requests.
+  // For the code that answers requests.
   [[nodiscard]] std::uint64_t number() const { return number_; }
   [[nodiscard]] const PeerCredentials& credentials() const { return credentials_; }
   [[nodiscard]] const NSXPCInterface* exportedInterface() const { return interface_; }
@@ -70,35 +76,35 @@ class ClientConnection : public NSXPCConnection,
   void sendReturn(std::uint32_t serial, std::string_view signature, const Value& value);
   void sendServiceError(std::uint32_t serial, const Error& error);
   void sendError(std::uint32_t serial, std::string_view name, std::string_view text);
-  // Counts a refused request, logs the first of its kind, and answers if an answer is wanted.
+  // Counts a refused request, logs the first of its kind, and sends an error if the client wants a
+  // reply.
   void refuse(const dbus::MessageHeader& request, Refusal reason, std::string_view errorName,
               const std::string& text);
-  // Something that the client sent breaks the rules of the wire.
+  // The client broke the rules of the wire. `what` says how and at which byte.
   virtual void onMalformed(const std::string& what);
 
-  // True when the client speaks to us without a bus between, so that we answer for the bus too.
+  // True for a client on our own socket. It has no bus, so the service answers calls to the bus.
   [[nodiscard]] virtual bool isPeerToPeer() const = 0;
-  // True the first time: whether the client has just introduced itself to the bus that we stand
-  // for.
+  // True at the first call. A client must say Hello to the bus exactly once.
   [[nodiscard]] bool takeHello();
 
  protected:
   [[nodiscard]] virtual FrameBuffer& input() = 0;
   [[nodiscard]] virtual SocketStream& stream() = 0;
-  // Where replies go; empty when there is no bus.
+  // The bus name of the client; empty without a bus.
   [[nodiscard]] virtual std::string_view replyDestination() const = 0;
   // Whether more input is wanted.
   virtual void setReading(bool reading) = 0;
-  // All whole frames are delivered; `begun` when a part of another is there, `progress` when some
-  // frame was used up this time.
+  // All whole frames have been delivered. `begun`: part of another frame is there. `progress`: at
+  // least one frame was delivered this time.
   virtual void onDelivered(bool begun, bool progress) = 0;
-  // The connection ended or was abandoned; its source of input has to be let go.
+  // The connection ended or was abandoned. The subclass stops its input.
   virtual void onEnded() = 0;
   virtual void onFinished() = 0;
 
-  // The stream has taken some of its output.
+  // The socket has taken some of the output.
   void onOutputRoom();
-  // Answers a request that is too large to be taken.
+  // Refuses a request that is larger than the limit.
   void refuseOversized(const FrameBuffer::Next& next);
   [[nodiscard]] bool hasEnded() const { return state_ == State::kEnded; }
   [[nodiscard]] bool wantsInput() const { return state_ == State::kReading; }
@@ -134,7 +140,7 @@ class ClientConnection : public NSXPCConnection,
   State state_ = State::kNotResumed;
   Why why_ = Why::kClosedHere;
   bool saidHello_ = false;
-  std::uint32_t loggedRefusals_ = 0;  // one bit a kind
+  std::uint32_t loggedRefusals_ = 0;  // one bit for each Refusal that was logged
   std::uint64_t unloggedRefusals_ = 0;
 };
 

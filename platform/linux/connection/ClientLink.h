@@ -15,8 +15,12 @@ namespace halvox::platform::linux_ {
 
 class ClientConnection;
 
-// What requests and replies know of the client that they belong to. They may outlive the connection
-// and live on any thread, so this is all that they share with it.
+// What requests and replies share with their client's connection. They can outlive the connection,
+// and other threads hold them, so they must not refer to the connection itself.
+//
+//   attached (the connection exists) --detach()--> detached: replies are dropped and counted
+//
+// Shared by the connection and its open requests and replies.
 class ClientLink : public std::enable_shared_from_this<ClientLink> {
  public:
   ClientLink(std::shared_ptr<Inbox> inbox, std::shared_ptr<ConnectionStatistics> statistics)
@@ -26,12 +30,12 @@ class ClientLink : public std::enable_shared_from_this<ClientLink> {
   [[nodiscard]] Inbox& inbox() { return *inbox_; }
   [[nodiscard]] ConnectionStatistics& statistics() { return *statistics_; }
 
-  // Any thread: a request has been carried out.
+  // A request has been carried out. Any thread.
   void requestDone(FlowControl::Cost cost) {
     if (flow_.close(cost)) inbox_->postRoom(shared_from_this());
   }
 
-  // On the I/O thread: the connection, or null once it is gone.
+  // The connection, or null after it has finished. I/O thread only.
   [[nodiscard]] ClientConnection* connection() const { return connection_; }
   void attach(ClientConnection& connection) { connection_ = &connection; }
   void detach() { connection_ = nullptr; }
@@ -43,7 +47,7 @@ class ClientLink : public std::enable_shared_from_this<ClientLink> {
   ClientConnection* connection_ = nullptr;
 };
 
-// What a RequestToken stands for: the request is open as long as this lives.
+// What a RequestToken points to: the request is open while this exists. Destroyed on any thread.
 class OpenRequest {
  public:
   OpenRequest(std::shared_ptr<ClientLink> client, FlowControl::Cost cost)
@@ -59,25 +63,25 @@ class OpenRequest {
   FlowControl::Cost cost_;
 };
 
-// The right to answer one request once. All copies of its ReplyCallback share it.
+// The right to answer one request once. All copies of the request's ReplyCallback share it.
 class ReplyTicket {
  public:
-  // `signature` is that of the answer and lives as long as the process.
+  // `signature` is that of the reply; it is a constant.
   ReplyTicket(std::shared_ptr<ClientLink> client, std::uint32_t serial, std::string_view signature)
       : client_(std::move(client)), serial_(serial), signature_(signature) {}
 
-  // Any thread. On the I/O thread the answer is written at the end of this turn; from others it is
-  // posted there.
+  // Any thread. On the I/O thread, where helped jobs run, the reply is encoded at once and written
+  // at the end of the turn. Other threads post it to the I/O thread.
   static void answer(const std::shared_ptr<ReplyTicket>& ticket, const std::optional<Error>& error,
                      const Value& value);
-  // On the I/O thread: hands the answer to the connection, if it is still there.
+  // Hands the reply to the connection, unless that has finished. I/O thread only.
   void deliver(const Error* error, const Value& value);
 
  private:
   std::shared_ptr<ClientLink> client_;
   std::uint32_t serial_;
   std::string_view signature_;
-  std::atomic<bool> answered_{false};  // orders with nothing: only who comes first counts
+  std::atomic<bool> answered_{false};  // relaxed: it only decides which call is the first
 };
 
 }  // namespace halvox::platform::linux_

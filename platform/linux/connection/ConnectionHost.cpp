@@ -37,7 +37,7 @@ ServiceIdentity makeIdentity(const std::string& busName) {
   return identity;
 }
 
-// Every client takes a descriptor; what the system allows this process is more than it starts with.
+// Every client takes a descriptor. The soft limit is usually 1,024, the hard limit much higher.
 void allowMoreDescriptors() {
   rlimit limit{};
   if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
@@ -78,11 +78,11 @@ std::optional<ConnectionOpenError> ConnectionHost::open() {
 
 std::optional<ConnectionOpenError> ConnectionHost::openLoop() {
   if (!loop_.isOpen() || !inbox_->watchWith(loop_) || !timer_.open(loop_)) {
-    return systemFailure("the event loop");
+    return systemFailure("cannot create the event loop");
   }
   if (options_.signals == EndSignals::kLeaveAlone) return std::nullopt;
   signals_ = std::make_unique<SignalWatch>([this] { stopping_ = true; }, options_.onReportSignal);
-  if (!signals_->start(loop_)) return systemFailure("the signals");
+  if (!signals_->start(loop_)) return systemFailure("cannot watch the signals");
   return std::nullopt;
 }
 
@@ -99,7 +99,7 @@ std::optional<ConnectionOpenError> ConnectionHost::openSockets() {
   }
   for (UniqueFd& fd : sockets) {
     listeners_.push_back(std::make_unique<ListeningSocket>(std::move(fd), *this));
-    if (!listeners_.back()->start()) return systemFailure("the listening socket");
+    if (!listeners_.back()->start()) return systemFailure("cannot watch the listening socket");
   }
   return std::nullopt;
 }
@@ -132,7 +132,8 @@ std::optional<ConnectionOpenError> ConnectionHost::joinBus(const std::string& ad
 
 void ConnectionHost::resume() {
   if (delegate_ == nullptr || listeners_.empty()) {
-    kLog.error("there is nothing to serve, or nobody to serve it");
+    kLog.error(
+        "resume() was called before open() succeeded or without a delegate; serving nothing");
     return;
   }
   inbox_->attachToThisThread();
@@ -215,7 +216,7 @@ void ConnectionHost::peerClosed(PeerConnection& peer) {
   for (const auto& listener : listeners_) listener->tryAgain();
 }
 
-// Also after an open() that failed half-way, and more than once.
+// May be called again, and after an open() that failed half-way.
 void ConnectionHost::shutDown() {
   inbox_->close();
   turn_.clear();

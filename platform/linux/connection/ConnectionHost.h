@@ -27,11 +27,23 @@ class PeerConnection;
 class SignalWatch;
 struct PeerCredentials;
 
-// What all connections of one service share, and the loop that serves them. One turn of the loop:
-// events (accept, read, deliver), the shares of those that had more, the handlers of connections
-// that ended, the end of the batch, mail of other threads, and one write for each connection that
-// has something to send.
-// Belongs to the thread that calls run(), but for requestStop(); made and opened before it.
+// What all connections of one service share, and the loop that serves them.
+//
+//   made --open()--> open --resume()--> serving --requestStop() or a signal--> shut down
+//
+// One turn of the loop does the following. The order matters:
+//   1. takes events: accepts, reads, decodes and delivers requests
+//   2. delivers for the clients that had more than their share in the last turn
+//   3. calls the handlers of connections that have ended
+//   4. ends the batch: this thread now runs the brief jobs that it queued (docs/decisions/0002)
+//   5. reads the mail of other threads
+//   6. writes: one system call for each connection with output, so all replies of the turn, those
+//   of
+//      helped jobs and of mail included, leave together
+//   7. wakes the pool for the queues that the jobs used
+//
+// The thread that calls resume() is the I/O thread, to which this belongs. Any thread may call
+// requestStop(). Owned by the connection service.
 class ConnectionHost final : public NSXPCListener {
  public:
   ConnectionHost(ConnectionOptions options, Backpressure& backpressure);
@@ -60,12 +72,12 @@ class ConnectionHost final : public NSXPCListener {
   [[nodiscard]] DeadlineQueue& messages() { return messages_; }
   [[nodiscard]] DeadlineQueue& acceptRetries() { return acceptRetries_; }
 
-  // A client is there. Both ask the delegate; false when it refused.
+  // A client has connected. Both ask the delegate. False when it refused.
   void acceptPeer(UniqueFd fd, const PeerCredentials& credentials);
   [[nodiscard]] bool admit(const std::shared_ptr<ClientConnection>& client);
   // The numbers of clients: 1, 2, ...
   [[nodiscard]] std::uint64_t nextClientNumber() { return ++lastClientNumber_; }
-  // A peer's descriptor was given back.
+  // The descriptor of a peer was closed.
   void peerClosed(PeerConnection& peer);
 
  private:

@@ -4,40 +4,44 @@
 #include <cstddef>
 #include <cstdint>
 
-// The bounds that the connection adapter keeps for each client and for each turn of its loop.
+// The bounds that the connection adapter keeps for each client and for each turn of its loop. They
+// are constants, not settings: they bound memory and fairness, and no client can tell them apart.
 namespace halvox::platform::linux_ {
 
 inline constexpr std::size_t kKiB = 1024;
 inline constexpr std::size_t kMiB = 1024 * kKiB;
 
-// A client is not read from while it has that many requests that are read but not carried out, or
-// while these hold that many bytes, and is read from again when half of them are done.
+// Flow control stops reading from a client that has this many open requests, or whose open requests
+// have this many bytes. It reads again when half of them have been carried out: without that gap, a
+// client at the bound would stop and start with every request, and each start costs a wake-up.
 inline constexpr std::size_t kMaxOpenRequests = 1024;
 inline constexpr std::size_t kMaxOpenRequestBytes = 4 * kMiB;
-// What a request counts as whose answer is a list that grows with the service's content: a few
-// thousand bytes of such requests could ask for gigabytes of answers.
+// How many requests a request counts as if its answer is a list that grows with the number of
+// sessions. Otherwise a few thousand bytes of requests could ask for gigabytes of answers.
 inline constexpr std::size_t kListRequestWeight = 64;
 
-// A client is not read from while that much waits for its socket to take it, either way.
+// Flow control also stops reading from a client that does not read: each of its requests would add
+// a reply to the memory. It reads again when half of the replies have been taken by the socket.
 inline constexpr std::size_t kMaxUnreadReplies = 256;
 inline constexpr std::size_t kMaxUnreadReplyBytes = 4 * kMiB;
 
-// What a sender on a bus may have waiting with us; the bus itself cannot be told to hold one sender
-// back, so what goes beyond is refused.
+// How many bytes of requests of one sender on a bus may wait. The bus cannot be asked to hold one
+// sender back, so requests beyond this are refused.
 inline constexpr std::size_t kMaxWaitingBytesOfSender = 4 * kMiB;
 
-// What one read asks the socket for; larger frames get a buffer of their own.
+// The size of one read. Frames larger than this get a buffer of their own.
 inline constexpr std::size_t kReadBytes = 64 * kKiB;
-// What a client may have delivered in one turn before the others have had theirs.
+// A client's share of one turn. What exceeds it waits until the other clients had theirs.
 inline constexpr std::size_t kTurnRequests = 64;
 inline constexpr std::size_t kTurnBytes = 64 * kKiB;
-// The same when more clients than kFewClients want something, or while a consumer is behind.
+// The share when more than kFewClients clients have requests, and while the store is behind: a turn
+// must not grow with the number of clients, since every reply of a turn waits for its end.
 inline constexpr std::size_t kShortTurnRequests = 16;
 inline constexpr std::size_t kFewClients = 4;
 
 inline constexpr int kEventsPerTurn = 64;
 inline constexpr int kAcceptsPerTurn = 64;
-// How long accepting waits when descriptors ran out and none of ours is given back.
+// How long accepting pauses when descriptors ran out and no connection of ours ends.
 inline constexpr std::chrono::milliseconds kAcceptRetryDelay{1000};
 
 }  // namespace halvox::platform::linux_

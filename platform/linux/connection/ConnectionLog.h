@@ -4,7 +4,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The category that all units of the connection adapter log under.
+// The log category of the connection adapter.
 LogCategory& connectionCategory();
 
 }  // namespace halvox::platform::linux_

@@ -9,7 +9,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Why a request was answered with an error before any object saw it.
+// Why the adapter answered a request with an error itself.
 enum class Refusal : std::uint8_t {
   kUnknownObject,
   kUnknownInterface,
@@ -23,16 +23,17 @@ enum class Refusal : std::uint8_t {
   kTooManyWaiting,
   kNotAllowed,
 };
-// Counted from the last of them, so that two new ones cannot count as one.
+// Derived from the last enumerator. Update it with every new one.
 inline constexpr std::size_t kRefusalKinds = static_cast<std::size_t>(Refusal::kNotAllowed) + 1;
 
-// The refusal as the statistics name it.
+// The name of the refusal in the statistics.
 std::string_view nameOf(Refusal refusal);
 
-// The adapter's counters. They balance:
+// The adapter's counters, looked up once: counting costs one relaxed addition. They balance:
 //   requests received = delivered + answered here + refused (by reason)
 //   replies given     = sent + dropped (by reason)
-// Bytes are those that went through the sockets, handshakes included. Any thread may count.
+// Bytes are those on the sockets, including handshakes. Any thread may count. The statistics
+// service owns the counters and must outlive this.
 struct ConnectionStatistics {
   explicit ConnectionStatistics(StatisticsService& service);
 

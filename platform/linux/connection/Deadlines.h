@@ -11,14 +11,15 @@ namespace halvox::platform::linux_ {
 
 class DeadlineQueue;
 
-// Who wants to hear when something took too long.
+// Is called when something took too long.
 class DeadlineOwner {
  public:
   virtual ~DeadlineOwner() = default;
   virtual void onDeadline() = 0;
 };
 
-// One deadline of an owner, in at most one queue; leaves it when destroyed. Belongs to one thread.
+// One deadline of an owner. It is in at most one queue, and leaves it when it is destroyed. Belongs
+// to the thread of the queue.
 class Deadline {
  public:
   explicit Deadline(DeadlineOwner& owner) : owner_(owner) {}
@@ -38,8 +39,9 @@ class Deadline {
   std::chrono::steady_clock::time_point at_;
 };
 
-// Deadlines that all have the same delay, so that the first one to start is the first one due and
-// starting or stopping one costs the same however many there are. Belongs to one thread.
+// Deadlines with the same delay. The one that started first is therefore the first one due, so a
+// linked list keeps the order, and starting or stopping a deadline takes constant time: every
+// request of every client may do both. Does not own the deadlines. Belongs to one thread.
 class DeadlineQueue {
  public:
   using Clock = std::chrono::steady_clock;
@@ -48,11 +50,11 @@ class DeadlineQueue {
   DeadlineQueue(const DeadlineQueue&) = delete;
   DeadlineQueue& operator=(const DeadlineQueue&) = delete;
 
-  // Starts a deadline; one that is running goes on as it was.
+  // Starts a deadline. Does nothing if it is running.
   void start(Deadline& deadline);
-  // When the first one is due.
+  // When the first deadline is due; none without deadlines.
   [[nodiscard]] std::optional<Clock::time_point> first() const;
-  // Stops each that is due and calls its owner.
+  // Stops each due deadline and calls its owner, which may start and stop deadlines.
   void expire(Clock::time_point now);
   [[nodiscard]] std::chrono::milliseconds delay() const { return delay_; }
 
@@ -65,15 +67,17 @@ class DeadlineQueue {
   Deadline* last_ = nullptr;
 };
 
-// The timer of a loop, set only while something can become due. Belongs to the loop's thread.
+// The timer of a loop. It is set only while something can become due, because an idle service makes
+// no wake-ups. Belongs to the loop's thread.
 class LoopTimer final : public EventSource {
  public:
   enum class Before : std::uint8_t { kSleep, kNextTurn };
 
   // False when the system gave no timer.
   [[nodiscard]] bool open(EventLoop& loop);
-  // Sees to it that the loop wakes up at `due`. A timer that is set too early is left alone, since
-  // it is set anew when it goes off; one that nobody needs is switched off before the loop sleeps.
+  // Makes the loop wake up at `due`. A timer that is set too early is left as it is, which saves a
+  // system call for most requests: it is set again when it expires. A timer that nobody needs is
+  // disabled before the loop sleeps.
   void arrange(std::optional<std::chrono::steady_clock::time_point> due, Before before);
   void onReady(std::uint32_t events) override;
 

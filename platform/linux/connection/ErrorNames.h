@@ -2,7 +2,7 @@
 
 #include <string_view>
 
-// The standard errors of D-Bus that requests are refused with.
+// The standard D-Bus errors with which requests are refused.
 namespace halvox::platform::linux_::error_names {
 
 inline constexpr std::string_view kAccessDenied = "org.freedesktop.DBus.Error.AccessDenied";

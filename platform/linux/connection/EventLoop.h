@@ -7,7 +7,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Something with a descriptor that an EventLoop watches.
+// The owner of a descriptor that an EventLoop watches.
 class EventSource {
  public:
   virtual ~EventSource() = default;
@@ -15,10 +15,11 @@ class EventSource {
   virtual void onReady(std::uint32_t events) = 0;
 };
 
-// Waits for descriptors to become ready, level-triggered: a source that does not take all there is
-// hears of it again in the next turn, after the others. Idle descriptors cost nothing per turn.
-// Belongs to one thread. Does not own sources; each must stay until the end of the turn in which it
-// was forgotten.
+// Waits for descriptors to become ready (epoll, level-triggered). A source that does not read all
+// that is there is called again in the next turn, after the others, so one busy client cannot
+// starve them. Idle descriptors cost nothing. Belongs to one thread. Does not own the sources. A
+// source must exist until the end of the turn in which it was forgotten: an event for it may
+// already have been fetched.
 class EventLoop {
  public:
   enum class Wait : std::uint8_t { kBlock, kPoll };
@@ -27,15 +28,15 @@ class EventLoop {
   EventLoop(const EventLoop&) = delete;
   EventLoop& operator=(const EventLoop&) = delete;
 
-  // False when the system gave no descriptor for it.
+  // False when the system has no descriptor left.
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(epoll_); }
 
-  // False when the system has no room for one more.
+  // `events` are those of epoll(7). False when the system refuses one more.
   [[nodiscard]] bool watch(int fd, std::uint32_t events, EventSource& source);
   void change(int fd, std::uint32_t events, EventSource& source);
   void forget(int fd);
 
-  // Waits, and calls each source that is ready, at most kEventsPerTurn of them. Returns how many.
+  // Waits, then calls the sources that are ready, at most kEventsPerTurn. Returns their number.
   std::size_t runOnce(Wait wait);
 
  private:

@@ -8,11 +8,16 @@
 
 namespace halvox::platform::linux_ {
 
-// Counts what one client has open, so that its reader can wait until the client's requests are
-// carried out. The reader's thread opens and waits; any thread closes.
+// Counts the open requests of one client, so that its reader can pause until they are carried out.
+// A flood then slows down the client that sends it, and memory stays bounded. ConnectionLimits.h
+// has the bounds.
+//
+//   below --open()--> full --wait()--> waiting --close() reaches half--> below, the reader is woken
+//
+// The I/O thread opens and waits; any thread closes. Owned by the client's link.
 class FlowControl {
  public:
-  // What one request counts as.
+  // How much one request counts for.
   struct Cost {
     std::size_t requests = 1;
     std::size_t bytes = 0;
@@ -20,9 +25,10 @@ class FlowControl {
 
   void open(Cost cost) { open_.fetch_add(packed(cost), std::memory_order_relaxed); }
 
-  // True when the reader waits and has room now: the caller must wake it, once.
+  // True when the reader waits and has room again. The caller must then wake it; only one is told.
   [[nodiscard]] bool close(Cost cost) {
-    // The order of this and of wait() matters: the one that comes second sees what the first did.
+    // Sequentially consistent with wait(): whichever of the two comes second sees what the first
+    // did, so the reader cannot sleep for ever.
     const std::uint64_t left = open_.fetch_sub(packed(cost)) - packed(cost);
     return hasRoomAgain(left) && waiting_.load() && waiting_.exchange(false);
   }
@@ -32,7 +38,7 @@ class FlowControl {
     return requestsIn(open) >= kMaxOpenRequests || bytesIn(open) >= kMaxOpenRequestBytes;
   }
 
-  // Asks to be woken when there is room again. False when there is by now.
+  // Asks to be woken when there is room again. False when there is room already.
   [[nodiscard]] bool wait() {
     waiting_.store(true);
     return !(hasRoomAgain(open_.load()) && waiting_.exchange(false));
@@ -41,7 +47,8 @@ class FlowControl {
   [[nodiscard]] std::size_t openRequests() const { return requestsIn(open_.load()); }
 
  private:
-  // One word for both sums: the requests in the low bits, the bytes above.
+  // Both sums in one word, so that one atomic operation changes both: the number of requests in the
+  // low 24 bits, the bytes above. Flow control keeps both far below their width.
   static constexpr unsigned kRequestBits = 24;
 
   static std::uint64_t packed(Cost cost) {

@@ -10,7 +10,8 @@ namespace {
 
 constexpr std::size_t kBodyLengthOffset = 4;
 
-// The header of a frame that is too large must fit, so that it can be answered.
+// The longest header of a frame over the limit. The header must fit into the scratch, because the
+// refusal answers it.
 constexpr std::size_t kMaxSkippableHeader = kReadBytes - 8;
 
 // The size of a header: its fixed part, the array of fields and the padding to 8 bytes.
@@ -25,7 +26,7 @@ std::size_t headerBytes(std::span<const std::byte> frame) {
 
 std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
   if (const std::size_t wanted = bytesThatDoNotFitScratch(); wanted > 0) {
-    // A header may promise a lot: room is made for as much again as has come, not for all of it.
+    // Doubles what has arrived instead of trusting the size that the header claims.
     const std::size_t offset = own_.size() - view_.size();
     const std::size_t grow = std::min(wanted, std::max(view_.size(), kReadBytes));
     own_.erase(own_.begin(), own_.begin() + static_cast<std::ptrdiff_t>(offset));
@@ -92,7 +93,10 @@ FrameBuffer::Next FrameBuffer::next() const {
     const std::size_t header = headerBytes(view_);
     if (header > kMaxSkippableHeader) {
       next.state = State::kBroken;
-      next.error = {"a message of " + std::to_string(measure.totalBytes) + " bytes", 0};
+      next.error = {"a message of " + std::to_string(measure.totalBytes) +
+                        " bytes is over the limit, and its header of " + std::to_string(header) +
+                        " bytes is too long to be answered",
+                    0};
     } else if (view_.size() >= header) {
       next.state = State::kOversized;
       next.bytes = view_.first(header);
@@ -117,8 +121,8 @@ std::vector<std::byte> FrameBuffer::withoutBody(const Next& oversized) {
   return frame;
 }
 
-// More than 0 when the next read must go to storage of our own: what is missing of a large frame,
-// or one read when more is left over than the scratch has room for.
+// Above 0 when the next read must go to storage of its own: the missing bytes of a large frame, or
+// the size of one read if more is left over than the scratch has room for.
 std::size_t FrameBuffer::bytesThatDoNotFitScratch() const {
   if (view_.size() >= dbus::kFrameStartBytes) {
     const dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);

@@ -11,8 +11,9 @@
 
 namespace halvox::platform::linux_ {
 
-// Where all connections of a thread read into, one after the other: room for the rest of the last
-// read and for a new one.
+// The memory into which all connections read, one after the other. One for all, because a buffer
+// for each connection would cost 128 KiB for each idle client, and because it stays in the cache.
+// It has room for what one connection has left over and for one more read. Owned by the host.
 class ReadScratch {
  public:
   ReadScratch() : bytes_(std::make_unique_for_overwrite<std::byte[]>(kBytes)) {}
@@ -23,18 +24,23 @@ class ReadScratch {
   std::unique_ptr<std::byte[]> bytes_;
 };
 
-// What one connection has received and not yet used up, cut into frames.
-// Frames are read where they arrive, in the shared scratch; only what is left over at the end of a
-// connection's share is copied to storage of its own. An idle connection holds no storage; a frame
-// larger than a read gets storage that grows with what has really arrived. Belongs to one thread.
+// What one connection has received and not used up, cut into frames.
+//
+//   readInto() --> read(2) --> received() --> next(), consume() ... --> settle()
+//
+// Frames are decoded in place, in the shared scratch. settle() copies what is left over to storage
+// of its own, which in most turns is nothing. An idle connection holds no storage. A frame larger
+// than a read gets storage that grows with the bytes that have arrived, not with the size that the
+// header claims: a client cannot reserve memory by announcing a large frame. Belongs to one thread.
+// Owned by its connection.
 class FrameBuffer {
  public:
   enum class State : std::uint8_t {
     kEmpty,
-    kPartial,    // a frame has begun
+    kPartial,    // a part of a frame
     kFrame,      // `bytes` is one whole frame of `totalBytes`
-    kOversized,  // a frame that is too large: `bytes` is its header alone
-    kBroken,     // no frame: `error` says why
+    kOversized,  // a frame over the limit; `bytes` is its header alone
+    kBroken,     // not a frame; `error` says why
   };
   struct Next {
     State state = State::kEmpty;

@@ -64,7 +64,7 @@ void Inbox::attachToThisThread() { loopThread_ = std::this_thread::get_id(); }
 
 void Inbox::close() {
   loopThread_ = std::thread::id();
-  Mail dropped;  // destroyed without the lock: what it holds may post in its turn
+  Mail dropped;  // destroyed after the lock is released: what it holds may post again
   const MutexLock lock(mutex_);
   closed_ = true;
   std::swap(dropped, mail_);

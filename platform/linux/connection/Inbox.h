@@ -16,14 +16,14 @@ namespace halvox::platform::linux_ {
 class ClientLink;
 class ReplyTicket;
 
-// An answer that was given on another thread.
+// A reply that was given on another thread.
 struct PostedReply {
   std::shared_ptr<ReplyTicket> ticket;
-  std::unique_ptr<Error> error;  // none for a success
+  std::unique_ptr<Error> error;  // null for a success
   Value value;
 };
 
-// What the other threads have for the I/O thread.
+// What other threads have posted to the I/O thread.
 struct Mail {
   std::vector<PostedReply> replies;
   std::vector<std::shared_ptr<ClientLink>> clientsWithRoom;
@@ -34,14 +34,19 @@ struct Mail {
   void clear();
 };
 
-// The way from any thread to the I/O thread. Whatever is posted while the I/O thread is awake
-// costs no system call; the first post while it sleeps wakes it.
-// Shared by the service and by everything that may outlive it; once closed it drops what is posted.
-// Bounded by what is open: one answer a request, one room a client.
+// The way from any thread to the I/O thread.
+//
+//   awake --trySleep()--> asleep --the first post writes to the eventfd--> awake ... --close()-->
+//   closed: drops what is posted
+//
+// A post while the I/O thread is awake costs a lock and no system call: it reads its mail at the
+// end of every turn. Only the first post while it sleeps wakes it. Shared by the service and by
+// replies and requests, which may outlive it. The number of letters is bounded by what is open: one
+// reply a request, one notice of room a client.
 class Inbox final : public EventSource {
  public:
   Inbox();
-  // False when the system gave no descriptor for it.
+  // False when the system has no descriptor left.
   [[nodiscard]] bool watchWith(EventLoop& loop);
 
   // From any thread.
@@ -49,16 +54,16 @@ class Inbox final : public EventSource {
   void postRoom(std::shared_ptr<ClientLink> client);
   void postRelief();
   void postStop();
-  // True on the thread that carries the loop out right now.
+  // True on the thread that runs the loop.
   [[nodiscard]] bool isLoopThread() const;
 
   // On the I/O thread.
   void attachToThisThread();
   void close();
-  // Says that the loop is going to sleep. False when there is mail, so that it must not.
+  // Announces that the loop is about to sleep. False when there is mail: it must not sleep.
   [[nodiscard]] bool trySleep();
   void awake();
-  // Swaps the mail with `into`, which must be empty.
+  // Swaps the mail with `into`, which must be empty. Swapping keeps the capacity of both sides.
   void take(Mail& into);
   void onReady(std::uint32_t events) override;
 
@@ -67,7 +72,7 @@ class Inbox final : public EventSource {
   void post(const Add& add);
 
   UniqueFd event_;
-  std::atomic<std::thread::id> loopThread_;  // orders with nothing: only equality to oneself counts
+  std::atomic<std::thread::id> loopThread_;  // relaxed: a thread only compares it with itself
   Mutex mutex_;
   Mail mail_ HALVOX_GUARDED_BY(mutex_);
   bool sleeping_ HALVOX_GUARDED_BY(mutex_) = false;

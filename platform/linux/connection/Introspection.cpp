@@ -52,7 +52,7 @@ void appendStandardInterfaces(std::string& xml, bool isObject) {
   if (!open.empty()) xml += " </interface>\n";
 }
 
-// The one child of a parent: the next element of the way to the object.
+// The name of a parent's only child: the next element of the object's path.
 std::string_view childOf(std::string_view path, std::string_view objectPath) {
   const std::size_t start = path == "/" ? 1 : path.size() + 1;
   return objectPath.substr(start, objectPath.find('/', start) - start);

@@ -7,8 +7,8 @@
 
 namespace halvox::platform::linux_ {
 
-// The introspection document of the exported object or of one of its parents, made from the table
-// of the interface.
+// The introspection document (XML) of the exported object or of one of its parents, generated from
+// the interface's table. `path` must be one of these.
 std::string introspectionOf(const NSXPCInterface& interface, std::string_view path);
 
 }  // namespace halvox::platform::linux_

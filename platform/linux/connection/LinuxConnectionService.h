@@ -21,90 +21,95 @@ namespace halvox::platform::linux_ {
 class ConnectionHost;
 class ListeningSocket;
 
-// Whether SIGTERM and SIGINT end the listener's resume().
+// Whether SIGTERM and SIGINT end the listener's resume(), and SIGUSR1 asks for a report.
 enum class EndSignals : std::uint8_t { kHandle, kLeaveAlone };
 
 // Who may connect to the socket's file.
 struct SocketAccess {
   std::uint32_t mode = defaults::kSocketModeOfSystem;  // permission bits
-  std::string group;  // the file is given to this group; empty: left as it is made
+  std::string group;  // the group of the file; empty: the process's own
 };
 
 // How connections are served.
 struct ConnectionOptions {
-  // These two are not used when the service is started through a socket.
+  // Where the socket is. Not used under socket activation, which passes sockets.
   std::filesystem::path socket;
   SocketAccess socketAccess;
-  // Makes the directory of the socket, if it alone is missing.
+  // Makes the directory of the socket if its parent exists.
   bool makeSocketDirectory = false;
-  BusKind bus = BusKind::kNone;  // nothing is served when it cannot be joined
-  // Joined too, unless it is `bus`. When that fails, the rest is served all the same: whatever a
-  // bus starts has this in its environment, and so have the programs that are started from there.
+  BusKind bus = BusKind::kNone;  // open() fails if it cannot be joined
+  // The bus that started the service. It is joined too, unless it is `bus`. A failure is only
+  // logged: a process inherits this from whatever a bus has started, so it may have nothing to do
+  // with us.
   std::optional<StarterBus> starter;
   std::string busName = "com.tarno.halvox.reporting";
   std::chrono::milliseconds handshakeTimeout{defaults::kHandshakeTimeout};
   std::chrono::milliseconds messageTimeout{defaults::kMessageTimeout};
   std::uint64_t clientHistoryMegabytes = defaults::kClientHistoryMegabytes;  // 2^20 bytes each
   std::uint64_t clientSessions = defaults::kClientSessions;
-  std::uint64_t messageReporterIDs = defaults::kMessageReporterIDs;  // named by one request
+  std::uint64_t messageReporterIDs =
+      defaults::kMessageReporterIDs;  // how many one request may name
   std::size_t maxFrameBytes = 32 * kMiB;
   EndSignals signals = EndSignals::kHandle;
-  // Called on the I/O thread before the first delivery of a turn, after the last one, and once the
-  // replies of the turn are written. A reply that is given on this thread during `endBatch` is
-  // among them.
+  // Called on the I/O thread: before the first delivery of a turn, after the last one, and after
+  // the replies of the turn have been written. Replies given on this thread during `endBatch` are
+  // among them. They connect the loop to the queues, which it does not know.
   std::function<void()> beginBatch;
   std::function<void()> endBatch;
   std::function<void()> afterReplies;
-  // Called on the I/O thread at SIGUSR1, when the signals are handled.
+  // Called on the I/O thread at SIGUSR1, if `signals` is kHandle.
   std::function<void()> onReportSignal;
 };
 
-// Why nothing can be served.
+// Why open() failed.
 struct ConnectionOpenError {
   enum class Kind : std::uint8_t {
     kPathTooLong,
     kDirectoryMissing,
     kDirectoryNotWritable,
-    kAlreadyServed,  // somebody answers on that socket
-    kNotASocket,     // a file of another kind is in the way
+    kAlreadyServed,  // another process answers on that socket
+    kNotASocket,     // a file of another kind exists at the path
     kUnknownGroup,   // the socket's group does not exist
-    kNotPermitted,   // the socket's file may not be given to its group
-    kBadActivation,  // a descriptor that was passed is no listening stream socket
+    kNotPermitted,   // the user may not give the file to that group
+    kBadActivation,  // a passed descriptor is not a listening stream socket
     kBusUnreachable,
     kBusNameTaken,
-    kSystem,  // anything else that the system refused
+    kSystem,  // any other system error
   };
   Kind kind = Kind::kSystem;
-  std::string description;  // one line for the user, naming the object and the system's error
+  std::string description;  // one line for the user: the object and the error
 };
 
-// Connections over D-Bus: peer to peer on a Unix socket of its own, on a bus when asked to, and on
-// the bus that started the process.
+// Connections over D-Bus: on a Unix socket of the service's own, on a bus if configured, and on the
+// bus that started the process.
 //
-// One thread, the one that calls resume() of the listener, carries out all input and output, runs
-// the delegate, the handlers and the requests. It never waits for a client: what a client does not
-// read is bounded and only its own requests wait for it. An idle service makes no wake-ups.
+//   made --open()--> open --the listener's resume()--> serving --requestStop() or a signal--> ended
 //
-// When the bus is lost, its senders are invalidated and the socket is served on.
-// At the end the handlers of connections that are still there are not called.
+// The thread that calls resume() is the I/O thread. It does all input and output, and calls the
+// delegate, the handlers and the requests. It never waits for a client: the replies that a client
+// does not read are bounded, and only that client's own requests wait. An idle service makes no
+// wake-ups.
+//
+// If a bus is lost, its senders are invalidated and the socket stays in service. At the end the
+// handlers of open connections are not called. Owned by the platform.
 class LinuxConnectionService final : public ConnectionService {
  public:
-  // Make it before the first thread starts: it takes the end signals from all threads to come, and
-  // the relief of `backpressure`, which must outlive it. Platform services must be installed when
-  // open() is called.
+  // Must be made before the first thread starts, because threads inherit the mask that it sets: the
+  // signals are blocked everywhere and read by the loop. Sets the relief handler of `backpressure`,
+  // which must outlive it. The platform's services must be installed before open().
   LinuxConnectionService(ConnectionOptions options, Backpressure& backpressure);
   LinuxConnectionService(const LinuxConnectionService&) = delete;
   LinuxConnectionService& operator=(const LinuxConnectionService&) = delete;
   ~LinuxConnectionService() override;
 
-  // Makes the socket, or takes the ones passed at start, and connects to the buses. A socket file
-  // that nobody serves any more is replaced. May wait for each bus, a few seconds at most. Lets
-  // the process have as many descriptors as it may.
+  // Makes the socket, or takes the sockets of socket activation, and joins the buses. Replaces a
+  // socket file that no process serves any more. Waits at most 5 seconds for each bus. Raises the
+  // process's limit of descriptors to the hard limit.
   [[nodiscard]] std::optional<ConnectionOpenError> open();
 
   NSXPCListener& serviceListener() override;
 
-  // Lets resume() return at the end of its turn. Any thread.
+  // Makes resume() return at the end of its turn. Any thread.
   void requestStop();
 
  private:

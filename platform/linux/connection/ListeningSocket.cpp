@@ -58,7 +58,7 @@ bool ListeningSocket::acceptOne() {
   const bool noDescriptors =
       error == EMFILE || error == ENFILE || error == ENOBUFS || error == ENOMEM;
   if (noDescriptors) waitForDescriptors(error);
-  // Anything but an empty backlog concerns one connection, and the next one may be well.
+  // Any other error but that of an empty backlog concerns one connection only. Try the next one.
   return !noDescriptors && error != EAGAIN && error != EINVAL && error != EBADF;
 }
 
@@ -68,7 +68,8 @@ void ListeningSocket::waitForDescriptors(int error) {
   host_.acceptRetries().start(retry_);
   if (std::exchange(isShort_, true)) return;
   host_.statistics().acceptPauses.add();
-  kLog.error("new connections have to wait: ", errnoText(error));
+  kLog.error("cannot accept connections (", errnoText(error),
+             "); new clients wait until a connection ends, retrying every second");
 }
 
 }  // namespace halvox::platform::linux_

@@ -10,9 +10,14 @@ namespace halvox::platform::linux_ {
 
 class ConnectionHost;
 
-// A socket whose connections the host serves. Belongs to the I/O thread.
-// When descriptors run out it waits, without looking, until a connection of ours ends or a second
-// has passed; the clients meanwhile wait in the socket's backlog.
+// A listening socket whose connections the host serves.
+//
+//   accepting --no descriptor is left--> paused --a connection ends, or a second passes-->
+//   accepting
+//
+// While it is paused the loop does not watch it: the socket stays readable, so a level-triggered
+// event would make the loop spin. Clients wait in the socket's backlog meanwhile.
+// Belongs to the I/O thread. Owned by the host.
 class ListeningSocket final : public EventSource, private DeadlineOwner {
  public:
   // Does not own the host, which must outlive this.
@@ -22,13 +27,13 @@ class ListeningSocket final : public EventSource, private DeadlineOwner {
 
   // False when the socket cannot be watched.
   [[nodiscard]] bool start();
-  // A descriptor was given back.
+  // A connection of ours has closed its descriptor.
   void tryAgain();
   void onReady(std::uint32_t events) override;
 
  private:
   void onDeadline() override { tryAgain(); }
-  // False when there is nothing more to accept now.
+  // False when nothing more can be accepted now.
   bool acceptOne();
   void waitForDescriptors(int error);
 
@@ -36,7 +41,7 @@ class ListeningSocket final : public EventSource, private DeadlineOwner {
   ConnectionHost& host_;
   Deadline retry_;
   bool isWaiting_ = false;
-  bool isShort_ = false;  // descriptors ran out and none was got since
+  bool isShort_ = false;  // descriptors ran out, and no accept has succeeded since
 };
 
 }  // namespace halvox::platform::linux_

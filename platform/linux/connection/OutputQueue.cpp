@@ -12,7 +12,8 @@ namespace {
 
 constexpr std::size_t kSpareBuffers = 16;
 constexpr std::size_t kMaxSpareBytes = 256 * kKiB;
-// Sent bytes are cut off the front of a buffer once there are that many, and most of it is sent.
+// Sent bytes are removed from the front of a buffer when they are at least this many and at least
+// half of it: removing moves the rest, which must not happen for every partial write.
 constexpr std::size_t kCompactBytes = 64 * kKiB;
 
 }  // namespace

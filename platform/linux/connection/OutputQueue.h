@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The bytes that wait for one socket, and where each frame in them ends.
+// Bytes that wait for one socket, and where each frame in them ends.
 struct OutputBuffer {
   std::string bytes;
   std::vector<std::size_t> frameEnds;
@@ -16,20 +16,21 @@ struct OutputBuffer {
   std::size_t sentFrames = 0;
 };
 
-// Buffers that no connection uses at the moment, so that an idle connection holds none and a busy
-// one allocates none. Belongs to one thread.
+// Spare buffers. They let an idle connection hold no buffer and a busy one allocate none. Belongs
+// to one thread. Owned by the host, which outlives the connections.
 class OutputBufferPool {
  public:
   std::unique_ptr<OutputBuffer> take();
-  // Keeps a few of ordinary size.
+  // Keeps up to 16 buffers of at most 256 KiB, and frees the others.
   void give(std::unique_ptr<OutputBuffer> buffer);
 
  private:
   std::vector<std::unique_ptr<OutputBuffer>> spare_;
 };
 
-// What one connection has to send. Frames are appended at the end and leave in order, all that are
-// there with one write; writing never blocks. Belongs to one thread.
+// What one connection has to send. Frames are appended and leave in order. One write sends all that
+// are there, so the replies of a turn cost one system call. Writing never blocks. Belongs to one
+// thread. Owned by its stream.
 class OutputQueue {
  public:
   enum class Flush : std::uint8_t { kEmpty, kBlocked, kPeerGone };
@@ -37,27 +38,27 @@ class OutputQueue {
   // Does not own the pool, which must outlive this.
   explicit OutputQueue(OutputBufferPool& pool) : pool_(pool) {}
 
-  // Where to append. Call frameAppended() after each frame that counts as a reply; other bytes,
-  // such as those of a handshake, are sent all the same.
+  // The buffer to append to. Call frameAppended() after each reply. Other bytes, such as those of
+  // the handshake, are sent too but do not count as replies.
   std::string& bytes();
   void frameAppended();
 
   [[nodiscard]] bool isEmpty() const { return buffer_ == nullptr; }
-  // Frames of which the socket has not taken the last byte.
+  // The number of frames whose last byte the socket has not taken.
   [[nodiscard]] std::size_t unsentFrames() const;
   [[nodiscard]] std::size_t unsentBytes() const;
 
-  // Offers all to the socket, once. Adds what it took to `sentBytes`. When the peer is gone, all is
-  // dropped and `droppedFrames` says how many frames that were.
+  // Writes once. Adds the number of bytes that the socket took to `sentBytes`. If the peer is gone,
+  // drops everything and adds the number of dropped frames to `droppedFrames`.
   Flush flush(int fd, std::size_t& sentBytes, std::size_t& droppedFrames);
-  // Drops all; returns how many frames that were.
+  // Drops everything. Returns the number of dropped frames.
   std::size_t clear();
 
  private:
   void noteSent(std::size_t count);
 
   OutputBufferPool& pool_;
-  std::unique_ptr<OutputBuffer> buffer_;  // none while there is nothing to send
+  std::unique_ptr<OutputBuffer> buffer_;  // null while there is nothing to send
 };
 
 }  // namespace halvox::platform::linux_

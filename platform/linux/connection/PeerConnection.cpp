@@ -35,7 +35,7 @@ void PeerConnection::setReading(bool reading) {
 }
 
 void PeerConnection::onReadable() {
-  // Whole messages that wait for the next turn come before what is still in the socket.
+  // Messages that were read and wait for the next turn must be delivered before more is read.
   if (handshake_ == nullptr && !wantsInput()) return;
   if (stream_.read() == SocketStream::Read::kEnded) {
     peerClosed_ = true;
@@ -62,7 +62,7 @@ bool PeerConnection::continueHandshake() {
       deadline_.stop();
       return true;
     case dbus::HandshakeState::kFailed:
-      kLog.notice("closing ", description(), ": the handshake failed: ", progress.error);
+      kLog.notice("disconnecting ", description(), ": the handshake failed: ", progress.error);
       end(Why::kClosedHere);
       return false;
   }
@@ -71,7 +71,10 @@ bool PeerConnection::continueHandshake() {
 
 void PeerConnection::onDelivered(bool begun, bool progress) {
   if (peerClosed_) {
-    if (begun) kLog.info("in the middle of a message went away ", description());
+    if (begun) {
+      kLog.info("", description(), " disconnected in the middle of a message; discarding ",
+                stream_.input().unused().size(), " bytes");
+    }
     return end(Why::kPeerVanished);
   }
   stream_.setReading(true);

@@ -13,15 +13,21 @@
 
 namespace halvox::platform::linux_ {
 
-// A client on a socket of its own. First the handshake, then requests; both must be finished in
-// time once they are begun, or the connection is closed with a line in the log. An idle connection
-// has no deadline and no buffer.
+// A client on the service's own socket.
+//
+//   handshake --BEGIN--> requests --the peer closes, or breaks the rules--> ended
+//       \--not complete in time--> ended      \--a frame is not complete in time--> ended
+//
+// A handshake and a frame must be complete within a timeout after they have begun: otherwise a
+// client could hold descriptors and memory for ever by sending half of something. An idle
+// connection has no deadline and no buffer. Belongs to the I/O thread. Shared by the host, the
+// lists of its turn and the delegate.
 class PeerConnection final : public ClientConnection, private StreamOwner, private DeadlineOwner {
  public:
   PeerConnection(ConnectionHost& host, std::uint64_t number, UniqueFd fd,
                  const PeerCredentials& credentials);
 
-  // Begins to read; what comes before resume() is taken no further than the handshake.
+  // Starts to read. Before resume() only the handshake is handled, not requests.
   void start();
   [[nodiscard]] std::string description() const override;
   [[nodiscard]] bool isPeerToPeer() const override { return true; }
@@ -39,11 +45,11 @@ class PeerConnection final : public ClientConnection, private StreamOwner, priva
   void onOutputProgress() override { onOutputRoom(); }
   void onDeadline() override;
 
-  // True when messages follow.
+  // True when the handshake is complete and messages follow.
   bool continueHandshake();
 
   SocketStream stream_;
-  std::unique_ptr<dbus::ServerHandshake> handshake_;  // none once it is done
+  std::unique_ptr<dbus::ServerHandshake> handshake_;  // null after the handshake
   Deadline deadline_;
   bool peerClosed_ = false;
 };

@@ -6,11 +6,11 @@
 
 namespace halvox::platform::linux_ {
 
-// The number that no user has.
+// The number that the kernel never gives to a user.
 inline constexpr uid_t kUnknownUser = static_cast<uid_t>(-1);
 
-// Who is at the other end of a connection, as the kernel or the bus says; never taken from a
-// request.
+// The process and user at the other end of a connection, as the kernel or the bus reports them.
+// Never taken from a request.
 struct PeerCredentials {
   ProcessID pid = 0;  // 0: unknown
   uid_t uid = kUnknownUser;

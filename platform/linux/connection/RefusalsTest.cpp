@@ -202,7 +202,7 @@ TEST(RefusalsTest, BytesThatAreNoMessageCloseOnlyThatConnection) {
 
   EXPECT_TRUE(client.isClosedByService());
   EXPECT_TRUE(eventually([&] { return service.count("connections closed: malformed") == 1U; }));
-  EXPECT_EQ(service.countLines(LogLevel::kError, "no D-Bus message"), 1U);
+  EXPECT_EQ(service.countLines(LogLevel::kError, "not a valid D-Bus message"), 1U);
   EXPECT_EQ(other.call("echo", "still here").text, "still here");
 }
 

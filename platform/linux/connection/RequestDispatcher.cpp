@@ -14,7 +14,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Names from the wire are valid, but a path can be as long as the message.
+// Names from the wire have a valid form, but a path can be as long as the message.
 std::string quoted(std::string_view name) {
   constexpr std::size_t kMaxShown = 255;
   std::string text = "\"";
@@ -117,13 +117,13 @@ bool RequestDispatcher::isForbidden(const Request& request, const InterfaceMetho
   const std::string who = user == kUnknownUser ? "an unknown user" : "uid " + std::to_string(user);
   request.client.refuse(request.header(), Refusal::kNotAllowed, error_names::kAccessDenied,
                         quoted(method.name) + ": only root and the service's own user (uid " +
-                            std::to_string(owner) + ") may ask for this, the client is " + who);
+                            std::to_string(owner) + ") may call this, the client is " + who);
   return true;
 }
 
-// The bytes of a request count from its delivery on, so a client can pass that bound by what one
-// request makes it hold. Sessions count once they are made: requests that were read and are not
-// carried out yet can make some more than the bound.
+// Both bounds can be passed a little. Bytes are charged when a request is delivered, so one request
+// may add to less than the bound. Sessions count when they have been made, so requests that are
+// open can make some more.
 bool RequestDispatcher::isOverLimits(const Request& request, const InterfaceMethod& method) {
   const ResourceUse use = request.client.exportedObject()->resourceUse();
   const std::uint64_t maxBytes = options_.clientHistoryMegabytes * kMiB;
@@ -132,14 +132,15 @@ bool RequestDispatcher::isOverLimits(const Request& request, const InterfaceMeth
         request.header(), Refusal::kHistoryLimit, error_names::kLimitsExceeded,
         "client_history_megabytes = " + std::to_string(options_.clientHistoryMegabytes) +
             " is reached: " + std::to_string(use.bytes) +
-            " bytes are held for the client, in its sessions and in messages that wait");
+            " bytes are held for the client, in its sessions and in messages that wait; stop or"
+            " destroy sessions");
     return true;
   }
   if (method.effect == MethodEffect::kMakesSession && use.sessions >= options_.clientSessions) {
     request.client.refuse(request.header(), Refusal::kSessionLimit, error_names::kLimitsExceeded,
                           "client_sessions = " + std::to_string(options_.clientSessions) +
                               " is reached: the client has " + std::to_string(use.sessions) +
-                              " sessions");
+                              " sessions; destroy some");
     return true;
   }
   return false;
@@ -153,7 +154,7 @@ bool RequestDispatcher::namesTooManyReporters(const Request& request,
   request.client.refuse(request.header(), Refusal::kReporterIDLimit, error_names::kLimitsExceeded,
                         "message_reporter_ids = " + std::to_string(options_.messageReporterIDs) +
                             " is exceeded: the message names " + std::to_string(named) +
-                            " reporter IDs");
+                            " reporter IDs; send it in several messages");
   return true;
 }
 
@@ -175,17 +176,18 @@ void RequestDispatcher::answerStandard(const Request& request, const StandardMet
   }
 }
 
-// False when the request was refused or the client closed.
+// False when the request was refused or the client disconnected.
 bool RequestDispatcher::decode(const Request& request, std::string_view signature) {
   const dbus::MessageHeader& header = request.header();
   if (header.unixFds != 0) {
-    request.client.refuse(
-        header, Refusal::kUnsupportedValue, error_names::kInvalidArgs,
-        "file descriptors (signature \"h\") are not taken by " + quoted(header.member));
+    request.client.refuse(header, Refusal::kUnsupportedValue, error_names::kInvalidArgs,
+                          quoted(header.member) + ": the message has " +
+                              std::to_string(header.unixFds) +
+                              " file descriptors (signature \"h\"), expected none");
     return false;
   }
   const std::optional<dbus::DecodeError> error =
-      dbus::decodeBody(request.frame, signature, arguments_);
+      dbus::decodeBody(request.frame, signature, arguments_, scratch_);
   if (!error.has_value()) return true;
   switch (error->kind) {
     case dbus::DecodeError::Kind::kMalformed:
@@ -205,10 +207,13 @@ bool RequestDispatcher::decode(const Request& request, std::string_view signatur
 
 void RequestDispatcher::refuseUnknown(const Request& request) {
   const dbus::MessageHeader& header = request.header();
+  const NSXPCInterface* exported = request.client.exportedInterface();
   switch (standard_.unknownPartOf(request.client, header)) {
     case UnknownPart::kObject:
-      request.client.refuse(header, Refusal::kUnknownObject, error_names::kUnknownObject,
-                            "there is no object at path " + quoted(header.path));
+      request.client.refuse(
+          header, Refusal::kUnknownObject, error_names::kUnknownObject,
+          "there is no object at path " + quoted(header.path) +
+              (exported == nullptr ? std::string() : ", expected " + quoted(exported->objectPath)));
       break;
     case UnknownPart::kInterface:
       request.client.refuse(header, Refusal::kUnknownInterface, error_names::kUnknownInterface,

@@ -6,6 +6,7 @@
 #include "platform/connection.h"
 #include "platform/linux/connection/StandardInterfaces.h"
 #include "platform/linux/connection/wire/Frame.h"
+#include "platform/linux/connection/wire/ValueDecoder.h"
 
 namespace halvox::platform::linux_ {
 
@@ -13,15 +14,16 @@ class ClientConnection;
 struct ConnectionOptions;
 struct ConnectionStatistics;
 
-// Takes one message to where it belongs: a method of the client's exported object, one of the
-// standard interfaces, or a refusal that says what is wrong with it.
-// Belongs to the I/O thread. Does not own what it is made with.
+// Decides what happens to one message: it is delivered to a method of the client's exported object,
+// answered by a standard interface, or refused with an error that says what is wrong with it.
+// Belongs to the I/O thread. Owned by the host. Does not own what it is made with, which must
+// outlive it.
 class RequestDispatcher {
  public:
   RequestDispatcher(const ConnectionOptions& options, ConnectionStatistics& statistics,
                     const ServiceIdentity& identity);
 
-  // `frameBytes` is the size of the message on the wire. The client may have ended afterwards.
+  // `frameBytes` is the size of the message on the wire. The client may end in this call.
   void dispatch(ClientConnection& client, const dbus::Frame& frame, std::size_t frameBytes);
 
  private:
@@ -38,7 +40,9 @@ class RequestDispatcher {
   const ConnectionOptions& options_;
   ConnectionStatistics& statistics_;
   StandardInterfaces standard_;
-  std::vector<Value> arguments_;  // of the request that is being delivered; kept for its capacity
+  // Empty between requests. Both are kept for their capacity: decoding then allocates values only.
+  std::vector<Value> arguments_;
+  dbus::DecodeScratch scratch_;
 };
 
 }  // namespace halvox::platform::linux_

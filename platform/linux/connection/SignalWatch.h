@@ -8,15 +8,16 @@
 
 namespace halvox::platform::linux_ {
 
-// Hears SIGTERM and SIGINT, and SIGUSR1, as events of a loop. Belongs to the loop's thread.
+// Receives SIGTERM, SIGINT and SIGUSR1 as events of a loop (signalfd), where the handlers may do
+// anything: a real signal handler may hardly do more than set a flag. Belongs to the loop's thread.
 class SignalWatch final : public EventSource {
  public:
-  // Keeps the three signals away from this thread and from those that it starts from now on.
+  // Blocks the three signals in this thread and in those that it starts from now on.
   static void block();
 
-  // SIGUSR1 calls `onReport`, which may be empty.
+  // SIGTERM and SIGINT call `onEnd`. SIGUSR1 calls `onReport`, which may be empty.
   SignalWatch(std::function<void()> onEnd, std::function<void()> onReport);
-  // False when the system gave no descriptor for it.
+  // False when the system has no descriptor left.
   [[nodiscard]] bool start(EventLoop& loop);
   void onReady(std::uint32_t events) override;
 

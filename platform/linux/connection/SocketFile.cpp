@@ -37,23 +37,26 @@ std::optional<sockaddr_un> addressOf(const std::filesystem::path& path) {
   return address;
 }
 
-// What stands at the path: nothing, a socket without anybody behind it, or something in the way.
+// Removes a socket file that no process serves. An error when anything else is at the path.
 std::optional<ConnectionOpenError> clearTheWay(const std::filesystem::path& path,
                                                const sockaddr_un& address) {
   struct stat status {};
-  if (lstat(path.c_str(), &status) != 0) return std::nullopt;  // bind() will say what is wrong
+  if (lstat(path.c_str(), &status) != 0) return std::nullopt;  // bind() reports other problems
   if (!S_ISSOCK(status.st_mode)) {
-    return failure(Kind::kNotASocket, path, "a file that is no socket is in its place");
+    return failure(Kind::kNotASocket, path,
+                   "a file that is not a socket exists there; remove it or set listener.socket");
   }
   const UniqueFd probe = newSocket();
   if (!probe) return failure(Kind::kSystem, path, errnoText(errno));
   const int result =
       connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
   if (result == 0 || errno == EAGAIN || errno == EINPROGRESS) {
-    return failure(Kind::kAlreadyServed, path, "another service answers on it");
+    return failure(Kind::kAlreadyServed, path,
+                   "another process answers on it; stop it or set listener.socket");
   }
   if (errno != ECONNREFUSED) {
-    return failure(Kind::kSystem, path, "cannot tell who serves it: " + errnoText(errno));
+    return failure(Kind::kSystem, path,
+                   "cannot find out whether another process serves it: " + errnoText(errno));
   }
   static_cast<void>(unlink(path.c_str()));
   return std::nullopt;
@@ -68,15 +71,15 @@ ConnectionOpenError bindFailure(const std::filesystem::path& path, int error) {
     case EROFS:
     case EPERM:
       return failure(Kind::kDirectoryNotWritable, path,
-                     "its directory cannot be written: " + errnoText(error));
+                     "cannot write to its directory: " + errnoText(error));
     case EADDRINUSE:
-      return failure(Kind::kAlreadyServed, path, "another service has just taken it");
+      return failure(Kind::kAlreadyServed, path, "another process has just made it");
     default:
       return failure(Kind::kSystem, path, errnoText(error));
   }
 }
 
-// The number of a group; none when there is none of that name, or an error number.
+// The ID of the group; none if there is no group of that name; or an errno value.
 std::variant<std::optional<gid_t>, int> findGroup(const std::string& name) {
   constexpr std::size_t kLargestEntry = std::size_t{1} << 24U;
   group entry{};
@@ -99,7 +102,7 @@ std::optional<ConnectionOpenError> giveToGroup(const std::filesystem::path& path
   if (const int* error = std::get_if<int>(&looked)) {
     return failure(
         Kind::kSystem, path,
-        "the group " + quoted + " of listener.group cannot be looked up: " + errnoText(*error));
+        "cannot look up the group " + quoted + " of listener.group: " + errnoText(*error));
   }
   const std::optional<gid_t> id = std::get<std::optional<gid_t>>(looked);
   if (!id.has_value()) {
@@ -113,18 +116,18 @@ std::optional<ConnectionOpenError> giveToGroup(const std::filesystem::path& path
   }
   return failure(errno == EPERM ? Kind::kNotPermitted : Kind::kSystem, path,
                  "cannot give it to the group " + quoted + " of listener.group: " +
-                     errnoText(errno) + "; only root and members of a group may");
+                     errnoText(errno) + "; only root and members of the group may do that");
 }
 
-// The file that bind() makes has the permissions of the descriptor, without those of the umask. It
-// begins with at most the owner's: a connect() that was admitted while the file was open to others
-// succeeds when the socket listens a moment later.
+// bind() gives the file the permissions of the descriptor, minus the umask. They start with at most
+// the owner's, because a connect() that was admitted while the file was open to others succeeds
+// when the socket listens a moment later.
 bool closeToOthers(int fd, const SocketAccess& access) {
   constexpr std::uint32_t kOwner = 0700;
   return fchmod(fd, access.mode & kOwner) == 0;
 }
 
-// The mode comes after the group: the members of the old group must not get in either.
+// Sets the group before the mode: the members of the old group must never get access.
 std::optional<ConnectionOpenError> letIn(const std::filesystem::path& path,
                                          const SocketAccess& access) {
   if (!access.group.empty()) {
@@ -173,8 +176,9 @@ std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::p
   const std::optional<sockaddr_un> address = addressOf(path);
   if (!address.has_value()) {
     return failure(Kind::kPathTooLong, path,
-                   "the path must have 1 to " + std::to_string(sizeof(sockaddr_un::sun_path) - 1) +
-                       " bytes, not " + std::to_string(path.native().size()));
+                   "expected a path of 1 to " + std::to_string(sizeof(sockaddr_un::sun_path) - 1) +
+                       " bytes, found " + std::to_string(path.native().size()) +
+                       "; set listener.socket");
   }
   if (std::optional<ConnectionOpenError> error = clearTheWay(path, *address)) {
     return *std::move(error);
@@ -210,14 +214,14 @@ std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
     if (sd_is_socket_unix(fd, SOCK_STREAM, kListening, nullptr, 0) <= 0) {
       return ConnectionOpenError{.kind = Kind::kBadActivation,
                                  .description = "the passed descriptor " + std::to_string(fd) +
-                                                " is no listening Unix stream socket"};
+                                                " is not a listening Unix stream socket"};
     }
     static_cast<void>(fcntl(fd, F_SETFL, O_NONBLOCK));
   }
   if (count < 0) {
     return ConnectionOpenError{
         .kind = Kind::kBadActivation,
-        .description = "the passed descriptors cannot be used: " + errnoText(-count)};
+        .description = "cannot use the passed descriptors: " + errnoText(-count)};
   }
   return sockets;
 }

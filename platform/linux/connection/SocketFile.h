@@ -12,8 +12,8 @@
 
 namespace halvox::platform::linux_ {
 
-// The file of a socket that we made. Removed with this object, unless somebody else's file is there
-// by then. Move-only.
+// The file of a socket that the service made. Removed with this object, unless another process has
+// replaced it meanwhile. Move-only.
 class SocketFile {
  public:
   SocketFile() = default;
@@ -37,18 +37,18 @@ struct BoundSocket {
   SocketFile file;
 };
 
-// Makes the socket at `path`. At no time can anybody connect whom `access` keeps out. A socket file
-// that nobody serves any more is replaced; any other file is left alone. Blocks for no longer than
-// a connect and a look-up of the group do.
+// Makes the socket at `path`. At no time can a user connect whom `access` excludes. Replaces a
+// socket file that no process serves any more, and never any other file. Blocks as long as a
+// connect and a look-up of the group take.
 std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
                                                         const SocketAccess& access = {});
 
-// Makes the directory that `path` is in, unless it is there: open to the same users as the socket
-// is. A failure is left to listenOn() to report.
+// Makes the directory of `path` unless it exists, open to the same users as the socket. listenOn()
+// reports a failure, because it knows whether the directory was needed.
 void makeDirectoryOf(const std::filesystem::path& path, const SocketAccess& access);
 
-// The sockets that the service was started through; none when it was started otherwise. Later
-// calls give none, and child processes do not inherit them.
+// The sockets that systemd passed at the start; empty without socket activation. Later calls return
+// none, and child processes do not inherit them.
 std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets();
 
 }  // namespace halvox::platform::linux_

@@ -43,7 +43,7 @@ void SocketStream::setReading(bool reading) {
 }
 
 void SocketStream::outputAdded() {
-  // While the socket is full, the next attempt waits until it says that it has room.
+  // While the socket is full, the loop tells us when it has room.
   if (flushing_ || blocked_) return;
   flushing_ = true;
   host_.turn().flushLater(*this);
@@ -84,8 +84,8 @@ void SocketStream::onReady(std::uint32_t events) {
   if (reading_ && (events & ~std::uint32_t{EPOLLOUT}) != 0) owner_.onReadable();
 }
 
-// A descriptor that waits for nothing is not watched at all: its peer's hang-up would be reported
-// again and again although it is not yet the time to look at it.
+// A descriptor without interest is removed from the loop. epoll reports a hang-up even for an empty
+// event mask, which would make the loop spin while flow control holds the client back.
 void SocketStream::updateInterest() {
   const std::uint32_t wanted =
       (reading_ ? std::uint32_t{EPOLLIN} : 0U) | (blocked_ ? std::uint32_t{EPOLLOUT} : 0U);

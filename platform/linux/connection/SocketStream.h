@@ -12,19 +12,19 @@ namespace halvox::platform::linux_ {
 
 class ConnectionHost;
 
-// Who works with the bytes of a SocketStream.
+// Handles the bytes of a SocketStream.
 class StreamOwner {
  public:
   virtual ~StreamOwner() = default;
-  // There is something to read, or the peer is gone.
+  // There is something to read, or the peer has closed.
   virtual void onReadable() = 0;
-  // The socket was offered what waited for it; or the peer is gone and all was dropped.
+  // The output was written as far as the socket took it, or dropped because the peer is gone.
   virtual void onOutputProgress() = 0;
 };
 
-// A connected socket with its unread input and unsent output; never blocks. Reads are asked for by
-// the owner, writes happen at the end of a turn, one for all that has come together.
-// Belongs to the I/O thread and to its owner.
+// A connected socket with its unread input and unsent output. Never blocks. The owner asks for
+// reads. Writes happen once, at the end of a turn, for everything that was added in it. Belongs to
+// the I/O thread. Owned by its connection.
 class SocketStream final : public EventSource {
  public:
   enum class Read : std::uint8_t { kBytes, kNothing, kEnded };
@@ -36,18 +36,19 @@ class SocketStream final : public EventSource {
   [[nodiscard]] FrameBuffer& input() { return input_; }
   [[nodiscard]] OutputQueue& output() { return output_; }
   [[nodiscard]] std::uint32_t nextSerial();
-  // Serials up to that one were used before this took the socket over.
+  // Continues after the serials that were used on the socket before.
   void skipSerials(std::uint32_t last) { lastSerial_ = last; }
 
-  // One read into input(), which must be settled before the turn goes on to others.
+  // One read into input(). The caller must settle the input before another stream reads: all share
+  // one scratch.
   Read read();
   // Whether onReadable() is wanted.
   void setReading(bool reading);
   // Call it after adding to output().
   void outputAdded();
-  // By the host, at the end of the turn.
+  // Writes. Called by the host at the end of the turn.
   void flush();
-  // Drops what is unsent, and what is added later. False when there was no descriptor to give back.
+  // Closes the descriptor, and drops the output and what is added later. False if it was closed.
   bool close();
 
   void onReady(std::uint32_t events) override;
@@ -61,9 +62,9 @@ class SocketStream final : public EventSource {
   FrameBuffer input_;
   OutputQueue output_;
   std::uint32_t lastSerial_ = 0;
-  std::uint32_t watched_ = 0;  // the events that the loop watches for; 0 when it does not know us
+  std::uint32_t watched_ = 0;  // the events that the loop watches for; 0: not watched
   bool reading_ = false;
-  bool blocked_ = false;  // the socket took less than there was
+  bool blocked_ = false;  // the socket took less than was there
   bool flushing_ = false;
 };
 

@@ -18,7 +18,8 @@ StandardAnswer ping(const StandardRequest& /*request*/) { return {}; }
 
 StandardAnswer getMachineId(const StandardRequest& request) {
   if (!request.identity.machineHex.empty()) return {.value = Value(request.identity.machineHex)};
-  return {.errorName = error_names::kFailed, .errorText = "this machine has no ID"};
+  return {.errorName = error_names::kFailed,
+          .errorText = "this machine has no ID (/etc/machine-id)"};
 }
 
 StandardAnswer introspect(const StandardRequest& request) {

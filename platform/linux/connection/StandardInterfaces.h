@@ -12,11 +12,11 @@ namespace halvox::platform::linux_ {
 
 class ClientConnection;
 
-// Who the service is, as clients of D-Bus ask for it.
+// The identity of the service, which D-Bus clients can ask for.
 struct ServiceIdentity {
-  std::string guidHex;     // 32 hexadecimal digits, anew at each start
+  std::string guidHex;     // 32 hexadecimal digits, random at each start
   std::string busName;     // the well-known name
-  std::string machineHex;  // 32 hexadecimal digits; empty when the system has none
+  std::string machineHex;  // 32 hexadecimal digits; empty if the machine has no ID
 };
 
 // The answer of a standard method: a value, or an error when `errorName` is not empty.
@@ -26,7 +26,7 @@ struct StandardAnswer {
   std::string errorText{};
 };
 
-// One call of a standard method; nothing of it outlives the call.
+// One call of a standard method. Everything in it is valid during the call only.
 struct StandardRequest {
   ClientConnection& client;
   std::string_view path;
@@ -39,7 +39,7 @@ enum class StandardScope : std::uint8_t {
   kEverywhere,     // any path at all
   kTree,           // the exported object and its parents
   kObject,         // the exported object
-  kStandInForBus,  // any path, for clients that have no bus between
+  kStandInForBus,  // any path, for clients without a bus
 };
 
 struct StandardMethod {
@@ -53,14 +53,15 @@ struct StandardMethod {
 
 // The methods of one standard interface.
 std::span<const StandardMethod> objectMethods();  // Peer, Introspectable and Properties
-std::span<const StandardMethod> busMethods();     // what a bus client asks its bus for
+std::span<const StandardMethod> busMethods();     // what a client asks its bus for
 
 // Which part of a request names something that does not exist.
 enum class UnknownPart : std::uint8_t { kObject, kInterface, kMethod };
 
-// The interfaces of D-Bus itself, which the adapter answers on behalf of the exported object, and,
-// for clients without a bus between, the little of the bus that they need to work unchanged.
-// Belongs to the I/O thread. Does not own the identity.
+// The interfaces of D-Bus itself, which the adapter answers on behalf of the exported object. For
+// clients on our own socket it also answers the few calls to the bus that client libraries make, so
+// that these work unchanged.
+// Belongs to the I/O thread. Owned by the dispatcher. Does not own the identity.
 class StandardInterfaces {
  public:
   explicit StandardInterfaces(const ServiceIdentity& identity) : identity_(identity) {}
@@ -68,7 +69,7 @@ class StandardInterfaces {
   // The standard method that a request asks for, or null.
   [[nodiscard]] const StandardMethod* find(const ClientConnection& client,
                                            const dbus::MessageHeader& request) const;
-  // Why find() and the exported object have nothing for the request.
+  // What is unknown in a request that neither find() nor the exported object knows.
   [[nodiscard]] UnknownPart unknownPartOf(const ClientConnection& client,
                                           const dbus::MessageHeader& request) const;
   [[nodiscard]] const ServiceIdentity& identity() const { return identity_; }

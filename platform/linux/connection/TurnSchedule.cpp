@@ -29,6 +29,7 @@ void TurnSchedule::finishNext(std::shared_ptr<ClientConnection> client) {
   ending_.push_back(std::move(client));
 }
 
+// The batch begins lazily: a turn without deliveries, such as one that only writes, needs none.
 void TurnSchedule::beforeDelivery() {
   if (inBatch_) return;
   inBatch_ = true;
@@ -72,7 +73,7 @@ void TurnSchedule::relieve() {
 }
 
 void TurnSchedule::flush() {
-  // A flush can make its owner deliver or end in the next turn, but adds no other flush.
+  // A flush can make its owner deliver or end in the next turn. It cannot add another flush.
   for (SocketStream* stream : flushing_) stream->flush();
   flushing_.clear();
   if (std::exchange(hasReplies_, false) && afterReplies_) afterReplies_();

@@ -11,41 +11,42 @@ namespace halvox::platform::linux_ {
 class ClientConnection;
 class SocketStream;
 
-// Whose turn it is: what each turn of the loop does besides taking events.
-// In one turn every client gets its share of deliveries, then all that was added to outputs is
-// written. Clients that have more than their share come again in the next turn, after those that
-// have just become readable. Belongs to the I/O thread.
+// The lists of clients and streams that a turn of the loop works through after it has taken events.
+// Every client gets its share of deliveries, then all outputs are written. A client with more than
+// its share continues in the next turn, after those that have just become readable, so a flood of
+// one client delays the others by at most a share. Belongs to the I/O thread. Owned by the host.
 class TurnSchedule {
  public:
-  // The hooks of ConnectionOptions.
+  // The functions of the same names in ConnectionOptions.
   TurnSchedule(std::function<void()> beginBatch, std::function<void()> endBatch,
                std::function<void()> afterReplies);
 
-  // Lets a client deliver in the next turn. Once for each time it says so.
+  // The client delivers in the next turn.
   void deliverNext(std::shared_ptr<ClientConnection> client);
-  // Lets a client deliver once the consumer that is behind has caught up.
+  // The client delivers after the store has caught up.
   void deliverWhenRelieved(std::shared_ptr<ClientConnection> client);
   void flushLater(SocketStream& stream);
-  // Lets a client that has ended finish in the next turn, after its last replies were written.
+  // The client, which has ended, finishes in the next turn, after its last replies were written.
   void finishNext(std::shared_ptr<ClientConnection> client);
-  // Call it before anything that reaches the service: a delivery, a handler, an acceptance.
+  // Call before anything that can queue jobs: a delivery, a handler, an acceptance. Begins the
+  // batch.
   void beforeDelivery();
 
-  // True when the next turn must not wait.
+  // True when the next turn must not sleep.
   [[nodiscard]] bool hasWork() const;
   // How many requests each client may have delivered in this turn.
   [[nodiscard]] std::size_t requestsPerClient() const { return requestsPerClient_; }
 
-  // The parts of a turn, in order. `readyCount` is how many sources had events.
+  // The parts of a turn, in this order. `readyCount` is the number of sources that had events.
   void begin();
   void deliver(std::size_t readyCount);
   void finishEnded();
   void endDeliveries();
   void relieve();
   void flush();
-  // Drops the clients that have finished. Nothing of this turn refers to them any more.
+  // Releases the clients that have finished. Until now events of this turn could refer to them.
   void reap() { finished_.clear(); }
-  // Forgets everybody: the loop has ended.
+  // Forgets all clients: the loop has ended.
   void clear();
 
  private:
@@ -57,8 +58,8 @@ class TurnSchedule {
   bool inBatch_ = false;
   bool hasReplies_ = false;  // of a batch, not written yet
   std::size_t requestsPerClient_;
-  Clients due_;   // this turn
-  Clients next_;  // the next one
+  Clients due_;   // deliver in this turn
+  Clients next_;  // deliver in the next turn
   Clients waitingForRelief_;
   Clients ending_;
   Clients ended_;

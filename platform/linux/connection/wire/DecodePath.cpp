@@ -8,7 +8,7 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// Enough to recognise a key by; a path has up to 64 of them.
+// Long enough to recognise a key. A path has up to 64 keys, and all of it goes into one log line.
 constexpr std::size_t kMaxQuotedBytes = 64;
 
 void appendEscaped(std::string& out, char byte) {

@@ -6,12 +6,13 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// Text of outside bytes that a line of a log can quote: printable ASCII and UTF-8 as they are,
-// everything else escaped, and cut when it is long. Always valid UTF-8.
+// Outside bytes as text for a log line. Printable ASCII and valid UTF-8 stay as they are,
+// everything else is escaped, and long texts are cut. The result is always valid UTF-8.
 [[nodiscard]] std::string quotable(std::string_view text);
 
-// Says where in the arguments of a message something is, as `argument 1, key "a"."b"[3]`.
-// Built from the inside out, by whoever leaves a container because of an error.
+// A place in the arguments of a message, such as `argument 1, key "a"."b"[3]`.
+// Built from the inside out while the decoder leaves its containers because of an error. Decoding
+// without an error therefore pays nothing for it.
 class DecodePath {
  public:
   void putBefore(std::string_view key);

@@ -9,10 +9,10 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// Limits that the wire itself sets. A connection sets tighter ones of its own.
+// Limits of D-Bus. Connections set a lower limit for frames.
 inline constexpr std::size_t kMaxMessageBytes = std::size_t{128} * 1024 * 1024;
 inline constexpr std::size_t kMaxArrayBytes = std::size_t{64} * 1024 * 1024;
-// Arrays, structs and variants inside each other; the entries of a dictionary are no level.
+// Arrays, structs and variants inside each other. Dictionary entries do not count as a level.
 inline constexpr unsigned kMaxNesting = 64;
 
 // The fixed part of a header and the length of its field array: what measureFrame() needs.
@@ -23,7 +23,8 @@ inline constexpr std::uint8_t kNoReplyExpected = 0x1;
 inline constexpr std::uint8_t kNoAutoStart = 0x2;
 inline constexpr std::uint8_t kAllowInteractiveAuthorization = 0x4;
 
-// A frame may carry a number that is none of these; such a frame is to be ignored (isKnown()).
+// A frame may have a type that is not listed here. D-Bus requires that such a frame is ignored
+// (isKnown()).
 enum class MessageType : std::uint8_t {
   kMethodCall = 1,
   kMethodReturn = 2,
@@ -35,8 +36,8 @@ enum class MessageType : std::uint8_t {
   return type >= MessageType::kMethodCall && type <= MessageType::kSignal;
 }
 
-// What the header of a message says. Texts are empty and numbers 0 when the field is absent.
-// The texts point into the bytes that the frame was read from.
+// The header of a message. Texts are empty and numbers 0 if the field is absent. The texts point
+// into the bytes that the frame was read from.
 struct MessageHeader {
   MessageType type = MessageType::kMethodCall;
   std::uint8_t flags = 0;
@@ -53,39 +54,39 @@ struct MessageHeader {
   std::uint32_t unixFds = 0;
 };
 
-// One message as it lies in the read buffer, which must outlive it. The body is not looked at yet.
+// One message in the read buffer, which must outlive it. The body has not been checked.
 struct Frame {
   MessageHeader header;
   std::span<const std::byte> body;
 };
 
-// Why bytes are no message: one line, and the byte of the frame at which it shows.
+// Why bytes are not a valid message: one line, and the offset in the frame where it shows.
 struct WireError {
   std::string message;
   std::size_t offset = 0;
 };
 
-// What the first bytes of a frame tell about its size.
+// The size of a frame, as its first bytes tell.
 struct FrameMeasure {
   enum class State : std::uint8_t {
-    kNeedMoreBytes,  // fewer than kFrameStartBytes are there, and nothing is wrong with them yet
+    kNeedMoreBytes,  // fewer than kFrameStartBytes are there, and these are valid so far
     kKnown,          // `totalBytes` is the size of the whole frame, of which more may be missing
-    kBroken,         // `error` says why this can be no frame, or none that is taken here
+    kBroken,         // not a valid frame, or over the limit; `error` says why
   };
   State state = State::kNeedMoreBytes;
   std::size_t totalBytes = 0;
   WireError error;
 };
 
-// Measures the frame that starts at the first of `bytes`. Frames of more than `maxFrameBytes` are
-// broken before any of their content is there.
+// Measures the frame that starts at the first of `bytes`. A frame of more than `maxFrameBytes` is
+// reported as broken as soon as its size is known, before its content has arrived.
 [[nodiscard]] FrameMeasure measureFrame(std::span<const std::byte> bytes,
                                         std::size_t maxFrameBytes);
 
-// Reads and checks the header of one whole frame of the size that measureFrame() told: field types,
-// the fields that the type of message must have, names, paths and signatures, numbers and padding.
-// Fields of unknown numbers are checked and skipped. A message of unknown type is no error.
-// After an error the stream makes no sense any more. Allocates nothing unless there is one.
+// Reads and checks the header of one whole frame, of the size that measureFrame() returned: the
+// types of fields, the fields required for the type of message, names, paths, signatures, numbers
+// and padding. Checks and skips fields with unknown numbers. Accepts messages of unknown types.
+// After an error the rest of the stream cannot be understood. Allocates memory for errors only.
 [[nodiscard]] std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame);
 
 }  // namespace halvox::platform::linux_::dbus

@@ -28,7 +28,7 @@ constexpr std::array<FieldRule, 10> kFieldRules{{{"", '\0'},
 
 constexpr unsigned fieldBit(HeaderField field) { return 1U << static_cast<unsigned>(field); }
 
-// Programs talk to themselves by these; they are never sent.
+// D-Bus reserves these for use inside one process. They must not be sent.
 constexpr std::string_view kLocalPath = "/org/freedesktop/DBus/Local";
 constexpr std::string_view kLocalInterface = "org.freedesktop.DBus.Local";
 
@@ -43,7 +43,7 @@ std::uint32_t numberAt(std::span<const std::byte> bytes, std::size_t offset, boo
   return number;
 }
 
-// The text of the problem with the bytes that every frame starts with; empty when there is none.
+// What is wrong with the bytes that every frame starts with, and where; empty if nothing is.
 std::string_view problemOfStart(std::span<const std::byte> bytes, std::size_t& offset) {
   offset = 0;
   if (!bytes.empty() && byteAt(bytes, 0) != 'l' && byteAt(bytes, 0) != 'B') {
@@ -72,7 +72,7 @@ class FieldReader {
   FieldReader(std::span<const std::byte> fields, bool bigEndian, MessageHeader& header)
       : reader_(fields, bigEndian), header_(header) {}
 
-  // False when something is wrong; error() says what.
+  // False on an error. error() then describes it.
   bool readAll() {
     while (!reader_.atLimit()) {
       if (!readField()) return false;
@@ -96,13 +96,13 @@ class FieldReader {
     if (!reader_.align(8) || !reader_.read(code_) || !reader_.readVariantSignature(type)) {
       return false;
     }
-    if (code_ == 0) return reader_.fail("no field has this number");
+    if (code_ == 0) return reader_.fail("a field cannot have the number 0");
     if (code_ >= kFieldRules.size()) return skipUnknown(type);
     if (type.size() != 1 || type.front() != kFieldRules[code_].type) {
-      return reader_.fail("not of the type that it must have");
+      return reader_.fail("its type is not the one that D-Bus defines");
     }
     const unsigned bit = 1U << code_;
-    if ((seen_ & bit) != 0) return reader_.fail("comes twice");
+    if ((seen_ & bit) != 0) return reader_.fail("occurs twice");
     seen_ |= bit;
     return readKnown(static_cast<HeaderField>(code_));
   }
@@ -110,7 +110,7 @@ class FieldReader {
   bool skipUnknown(std::string_view type) {
     const SignatureShape shape = shapeOfType(type);
     if (shape == SignatureShape::kBroken || shape == SignatureShape::kTooDeep) {
-      return reader_.fail("its signature is not valid");
+      return reader_.fail("its signature is invalid");
     }
     return skipValue(reader_, type);
   }
@@ -119,18 +119,19 @@ class FieldReader {
     switch (field) {
       case HeaderField::kPath:
         return reader_.readPath(header_.path) &&
-               (header_.path != kLocalPath || reader_.fail("a path that is never sent"));
+               (header_.path != kLocalPath ||
+                reader_.fail("this path is reserved and must not be sent"));
       case HeaderField::kInterface:
         return readName(header_.interface, isInterfaceName) &&
                (header_.interface != kLocalInterface ||
-                reader_.fail("an interface that is never sent"));
+                reader_.fail("this interface is reserved and must not be sent"));
       case HeaderField::kMember:
         return readName(header_.member, isMemberName);
       case HeaderField::kErrorName:
         return readName(header_.errorName, isInterfaceName);
       case HeaderField::kReplySerial:
         return reader_.read(header_.replySerial) &&
-               (header_.replySerial != 0 || reader_.fail("it is 0"));
+               (header_.replySerial != 0 || reader_.fail("must not be 0"));
       case HeaderField::kDestination:
         return readName(header_.destination, isBusName);
       case HeaderField::kSender:
@@ -143,9 +144,10 @@ class FieldReader {
     return false;
   }
 
-  // Names are of a few ASCII characters, so their rules make a check of the text unnecessary.
+  // The rules of names allow ASCII characters only, so the check for UTF-8 is not needed. It would
+  // go over every name twice, in every frame.
   bool readName(std::string_view& name, bool (*isValid)(std::string_view)) {
-    return reader_.readUncheckedText(name) && (isValid(name) || reader_.fail("not a valid name"));
+    return reader_.readUncheckedText(name) && (isValid(name) || reader_.fail("invalid name"));
   }
 
   bool checkRequired() {
@@ -171,23 +173,23 @@ class FieldReader {
   }
 
   WireReader reader_;
-  MessageHeader& header_;  // of the caller, who outlives this
+  MessageHeader& header_;  // of the caller, which outlives this
   std::uint8_t code_ = 0;
   unsigned seen_ = 0;  // a bit for each known field
 };
 
-// What is behind the fields: padding and the body.
+// Checks what follows the fields: padding and the body.
 std::variant<Frame, WireError> finish(MessageHeader header, std::span<const std::byte> frame,
                                       std::size_t fieldsEnd) {
   const std::size_t bodyStart = roundedUp(fieldsEnd);
   for (std::size_t offset = fieldsEnd; offset < bodyStart; ++offset) {
     if (byteAt(frame, offset) != 0) {
-      return WireError{"the padding behind the header is not zero", offset};
+      return WireError{"the padding after the header is not zero", offset};
     }
   }
   const std::span<const std::byte> body = frame.subspan(bodyStart);
   if (header.signature.empty() && !body.empty()) {
-    return WireError{"there is a body but no signature", bodyStart};
+    return WireError{"the message has a body but no signature", bodyStart};
   }
   return Frame{header, body};
 }
@@ -204,15 +206,17 @@ FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrame
   const std::uint64_t bodyBytes = numberAt(bytes, kBodyLengthOffset, bigEndian);
   const std::uint64_t fieldsBytes = numberAt(bytes, kFieldsLengthOffset, bigEndian);
   if (fieldsBytes > kMaxArrayBytes) {
-    return broken("the header has more than 64 MiB of fields", kFieldsLengthOffset);
+    return broken("the header claims more than 64 MiB of fields", kFieldsLengthOffset);
   }
   const std::uint64_t total = roundedUp(kFrameStartBytes + fieldsBytes) + bodyBytes;
   if (total > kMaxMessageBytes) {
-    return broken("a message of more than 128 MiB", kBodyLengthOffset);
+    return broken("the header claims a message of " + std::to_string(total) +
+                      " bytes, the limit of D-Bus is " + std::to_string(kMaxMessageBytes),
+                  kBodyLengthOffset);
   }
   if (total > maxFrameBytes) {
-    return broken("a message of " + std::to_string(total) + " bytes, where " +
-                      std::to_string(maxFrameBytes) + " are the limit",
+    return broken("the header claims a message of " + std::to_string(total) +
+                      " bytes, the limit is " + std::to_string(maxFrameBytes),
                   kBodyLengthOffset);
   }
   return {FrameMeasure::State::kKnown, static_cast<std::size_t>(total), {}};
@@ -222,14 +226,14 @@ std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame) {
   const FrameMeasure measure = measureFrame(frame, kMaxMessageBytes);
   if (measure.state == FrameMeasure::State::kBroken) return measure.error;
   if (measure.state != FrameMeasure::State::kKnown || measure.totalBytes != frame.size()) {
-    return WireError{"not the size that the header tells", frame.size()};
+    return WireError{"the frame has another size than its header says", frame.size()};
   }
   MessageHeader header;
   header.type = static_cast<MessageType>(byteAt(frame, kTypeOffset));
   header.flags = byteAt(frame, kFlagsOffset);
   header.bigEndian = byteAt(frame, 0) == 'B';
   header.serial = numberAt(frame, kSerialOffset, header.bigEndian);
-  if (header.serial == 0) return WireError{"the serial number is 0", kSerialOffset};
+  if (header.serial == 0) return WireError{"the serial number must not be 0", kSerialOffset};
 
   const std::size_t fieldsBytes = numberAt(frame, kFieldsLengthOffset, header.bigEndian);
   FieldReader fields(frame.subspan(kFrameStartBytes, fieldsBytes), header.bigEndian, header);

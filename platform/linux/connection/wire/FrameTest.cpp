@@ -74,15 +74,16 @@ TEST(FrameTest, SmallestCallIsTaken) {
 }
 
 TEST(FrameTest, SerialOfZeroIsRefused) {
-  EXPECT_EQ(errorOf(frameOf(1, callFields(""), "", 0)), "the serial number is 0");
+  EXPECT_EQ(errorOf(frameOf(1, callFields(""), "", 0)), "the serial number must not be 0");
 }
 
 TEST(FrameTest, BytesBehindTheFrameAreRefused) {
-  EXPECT_EQ(errorOf(frameOf(1, callFields(""), "") + "x"), "not the size that the header tells");
+  EXPECT_EQ(errorOf(frameOf(1, callFields(""), "") + "x"),
+            "the frame has another size than its header says");
 }
 
 TEST(FrameTest, BodyWithoutASignatureIsRefused) {
-  EXPECT_EQ(errorOf(frameOf(1, callFields(""), "x")), "there is a body but no signature");
+  EXPECT_EQ(errorOf(frameOf(1, callFields(""), "x")), "the message has a body but no signature");
 }
 
 TEST(FrameTest, UnknownTypesAreReadSoThatTheyCanBeIgnored) {
@@ -203,7 +204,7 @@ TEST(FrameTest, PaddingThatIsNotZeroIsRefused) {
 
   EXPECT_EQ(errorOf(sound), "");
   EXPECT_NE(errorOf(betweenFields), "");
-  EXPECT_EQ(errorOf(behindFields), "the padding behind the header is not zero");
+  EXPECT_EQ(errorOf(behindFields), "the padding after the header is not zero");
 }
 
 TEST(FrameTest, ErrorTellsTheByte) {
@@ -211,7 +212,7 @@ TEST(FrameTest, ErrorTellsTheByte) {
 
   ASSERT_TRUE(std::holds_alternative<WireError>(result));
   const auto& error = std::get<WireError>(result);
-  EXPECT_EQ(error.message, "header field 6 (destination): not a valid name");
+  EXPECT_EQ(error.message, "header field 6 (destination): invalid name");
   EXPECT_EQ(error.offset, 16U + 32 + 10);
 }
 

@@ -10,8 +10,8 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// Appends one frame: its header field by field, then the body. Takes everything back again unless
-// it was finished well. The buffer is the caller's and outlives this.
+// Appends one frame: its header field by field, then the body. Removes everything again unless
+// finish() succeeds. The caller owns the buffer, which must outlive this.
 class FrameBuilder {
  public:
   FrameBuilder(std::string& out, MessageType type, std::uint8_t flags, std::uint32_t serial)
@@ -82,8 +82,8 @@ bool isValid(const CallTarget& target, std::uint32_t serial) {
          isObjectPath(target.path) && isMemberName(target.member);
 }
 
-// Nearly all replies have no value or a boolean and go to a peer without a name. Their frames are
-// the same but for three numbers.
+// Nearly all replies have no value or a boolean, and go to a client without a bus name. Their
+// frames differ in three numbers only, so they are copied from a constant instead of being built.
 constexpr std::size_t kPlainReplyBytes = 24;
 constexpr std::size_t kBooleanReplyBytes = 36;
 constexpr std::array<char, kBooleanReplyBytes> kPlainReply{'l',

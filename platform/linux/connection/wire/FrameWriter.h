@@ -7,22 +7,22 @@
 
 #include "platform/value.h"
 
-// Writers of whole frames, little endian, behind what is already in `out`.
+// These functions append a whole frame, little endian, to `out`. Any thread may call them.
 //
-// Each returns false and leaves `out` as it was when what it is given has no form on the wire: a
-// value that does not fit its signature, text that is not UTF-8 or has a NUL in it, a name or path
-// that is not valid, a serial of 0, nesting of more than kMaxNesting containers (where the entries
-// of a dictionary count too, as some readers count them), an array or message over the wire's
-// limits. Their allocation is that of `out` growing.
+// Each returns false and leaves `out` unchanged if the message cannot be encoded: a value does not
+// fit its signature, a text is not UTF-8 or contains a NUL, a name or path is invalid, a serial is
+// 0, containers nest more than kMaxNesting levels (dictionary entries count here, because some
+// readers count them), or an array or the message exceeds the limits of D-Bus. The only memory that
+// they allocate is that of `out`.
 namespace halvox::platform::linux_::dbus {
 
-// The call that a reply answers. `destination` is the caller's name on a bus; empty without a bus.
+// The call that a reply answers. `destination` is the caller's bus name; empty without a bus.
 struct ReplyTo {
   std::uint32_t serial = 0;
   std::string_view destination;
 };
 
-// Where a call goes. `destination` and `interface` may be empty.
+// The target of a call. `destination` and `interface` may be empty.
 struct CallTarget {
   std::string_view destination;
   std::string_view path;
@@ -30,15 +30,16 @@ struct CallTarget {
   std::string_view member;
 };
 
-// A reply with one value of the given type, or, when the signature is empty, with none.
+// A reply with one value of the given type, or without a value if the signature is empty.
 //
-// Numbers take the integer or floating-point type asked for (what lies outside its range becomes
-// the nearest end), any number can be a boolean. `(d)` takes a date, `ay` data or an array of
-// numbers, `a{s…}` a dictionary, other arrays an array, `o` and `g` a string that is a valid one.
-// Other structs, file descriptors and dictionaries with other keys have no form, nor has no value
-// at all. A variant holds the natural type: that of the number's kind (`d` for a float), `s`,
-// `(d)`, `ay`, `a{sv}`; an array whose elements have one type is an array of that type, any other
-// is `av`.
+// A number is encoded as the integer or floating-point type of the signature; a value outside its
+// range becomes the nearest end of the range. Any number can be a boolean. `(d)` takes a date, `ay`
+// data or an array of numbers, `a{s…}` a dictionary, other arrays an array, `o` and `g` a string
+// that is valid as such. Other structs, file descriptors, dictionaries with other keys and the
+// absent value cannot be encoded. A variant gets the natural type of its value: that of the
+// number's kind
+// (`d` for a float), `s`, `(d)`, `ay`, `a{sv}`. An array whose elements have one type is an array
+// of that type, any other is `av`.
 [[nodiscard]] bool appendMethodReturn(std::string& out, const ReplyTo& replyTo,
                                       std::uint32_t serial, std::string_view signature,
                                       const Value& value);

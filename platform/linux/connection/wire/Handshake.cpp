@@ -12,7 +12,7 @@ struct Command {
   std::string_view arguments;
 };
 
-// A line's first word, and what is behind the blank after it.
+// The first word of a line, and what follows the blank after it.
 Command split(std::string_view line) {
   const std::size_t blank = line.find(' ');
   if (blank == std::string_view::npos) return {line, {}};
@@ -94,7 +94,7 @@ HandshakeProgress ServerHandshake::feed(std::span<const std::byte> input, std::s
     rest = rest.subspan(1);
   }
   while (!isOver() && line_.take(rest)) onLine(line_.text(), output);
-  if (!isOver() && line_.isTooLong()) fail("a line of more than 16 KiB");
+  if (!isOver() && line_.isTooLong()) fail("a line has more than 16 KiB");
 
   HandshakeProgress progress;
   progress.consumedBytes = input.size() - rest.size();
@@ -126,7 +126,7 @@ void ServerHandshake::onLine(std::string_view line, std::string& output) {
     output += "ERROR file descriptors are not taken\r\n";
     countRefusal();
   } else {
-    refuse("unknown command, or not its time", output);
+    refuse("unknown command, or one that is not expected now", output);
   }
 }
 
@@ -134,7 +134,7 @@ void ServerHandshake::onAuth(std::string_view arguments, std::string& output) {
   const auto [mechanism, response] = split(arguments);
   if (mechanism == "ANONYMOUS") {
     if (isHex(response)) {
-      accept(output);  // what the client calls itself is of no use here
+      accept(output);  // the trace that the client sends is not used
     } else {
       reject(output);
     }
@@ -182,7 +182,7 @@ void ServerHandshake::refuse(std::string_view reason, std::string& output) {
 }
 
 void ServerHandshake::countRefusal() {
-  if (++refusedLines_ > kMaxRefusedLines) fail("too many attempts that were refused");
+  if (++refusedLines_ > kMaxRefusedLines) fail("more than 16 lines were refused");
 }
 
 void ServerHandshake::fail(std::string error) {

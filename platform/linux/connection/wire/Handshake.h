@@ -8,33 +8,34 @@
 
 #include <sys/types.h>
 
-// The authentication that comes before the first message, for either side, without input or output
-// of its own: the owner of the socket hands in what it read and sends what it is given.
+// The authentication before the first message, for either side. It does no input or output: the
+// owner of the socket passes in what it has read, and sends what it gets.
 namespace halvox::platform::linux_::dbus {
 
 enum class HandshakeState : std::uint8_t {
   kContinue,  // more input is needed
-  kDone,      // messages follow; input behind the consumed bytes is already part of them
-  kFailed,    // send the output that there is, then close
+  kDone,      // messages follow, starting after the consumed bytes
+  kFailed,    // send the remaining output, then close
 };
 
-// What one step of a handshake came to.
+// The result of one step of a handshake.
 struct HandshakeProgress {
   HandshakeState state = HandshakeState::kContinue;
-  // How much of the input belonged to the handshake. All of it, unless the handshake is done.
+  // How much of the input belonged to the handshake: all of it, unless the handshake is done.
   std::size_t consumedBytes = 0;
   // Why it failed: one line of printable ASCII.
   std::string error;
 };
 
-// A line longer than this, and more refused lines than that, end a handshake.
+// A handshake fails at a line longer than kMaxHandshakeLine, and after kMaxRefusedLines refused
+// lines: a client that does not know the protocol must not keep the service busy.
 inline constexpr std::size_t kMaxHandshakeLine = std::size_t{16} * 1024;
 inline constexpr unsigned kMaxRefusedLines = 16;
 
-// Collects the lines of a handshake from input that comes in pieces of any size.
+// Collects the lines of a handshake from input that arrives in pieces of any size.
 class HandshakeLine {
  public:
-  // Takes input up to the end of the line and drops it from `input`. True when the line is
+  // Takes bytes up to the end of the line, and removes them from `input`. True when the line is
   // complete.
   bool take(std::span<const std::byte>& input);
   // The line without its end; valid until the next take().
@@ -46,21 +47,23 @@ class HandshakeLine {
   bool complete_ = false;
 };
 
-// The service's side. Who the peer is comes from the credentials of the socket (`peerUid`); an
-// identity that the client claims must be that one or be left out.
+// The service's side. The identity of the peer comes from the credentials of the socket
+// (`peerUid`). A client may omit its identity; if it claims one, it must be that one.
 //
 //   NUL ──► auth ──AUTH──► begin ──BEGIN──► done
 //            │▲  AUTH without an identity: data ──DATA──► begin
-//            └┘  whatever is refused
+//            └┘  anything that is refused
 //
-// Offers EXTERNAL and ANONYMOUS; takes no file descriptors. Belongs to one thread.
+// Offers EXTERNAL and ANONYMOUS. ANONYMOUS is no less safe, because the kernel has already told who
+// the peer is. Does not agree to pass file descriptors. Belongs to the thread of the connection,
+// which owns it until the handshake is done.
 class ServerHandshake {
  public:
-  // `guidHex` is the address's 32 hexadecimal digits.
+  // `guidHex` is the identity of the service, 32 hexadecimal digits.
   ServerHandshake(std::string guidHex, uid_t peerUid);
 
-  // Takes input in pieces as they come and appends the answers to `output`. Once done or failed it
-  // takes nothing more.
+  // Takes input in pieces of any size, and appends the answers to `output`. Takes nothing more
+  // after it is done or has failed.
   HandshakeProgress feed(std::span<const std::byte> input, std::string& output);
 
  private:
@@ -85,15 +88,18 @@ class ServerHandshake {
   std::string error_;
 };
 
-// The side of a client that connects to a bus as this user. Belongs to one thread.
+// The side of a client that connects to a bus as this user. Belongs to one thread and is owned by
+// the connector.
+//
+//   start() ──► waiting for OK ──► done, or failed at any other line
 class ClientHandshake {
  public:
   explicit ClientHandshake(uid_t uid) : uid_(uid) {}
 
-  // Appends what the client says first. Call it once, before feed().
+  // Appends the first line of the client. Call it once, before feed().
   void start(std::string& output) const;
-  // Takes the server's answers. Done as soon as the server agreed; `output` then has the line after
-  // which messages may follow.
+  // Takes the server's answers. It is done when the server has agreed; `output` then ends with
+  // BEGIN, after which messages may follow.
   HandshakeProgress feed(std::span<const std::byte> input, std::string& output);
   // The identity of the server; empty before the handshake is done.
   [[nodiscard]] std::string_view serverGuid() const { return guid_; }

@@ -3,12 +3,12 @@
 #include <cstddef>
 #include <cstdint>
 
-// The layout of a header, for those who read and write it.
+// The layout of a message header, shared by the reader and the writer.
 namespace halvox::platform::linux_::dbus {
 
 inline constexpr std::uint8_t kProtocolVersion = 1;
 
-// Where the fixed part of a header has what.
+// Offsets in the fixed part of a header.
 inline constexpr std::size_t kTypeOffset = 1;
 inline constexpr std::size_t kFlagsOffset = 2;
 inline constexpr std::size_t kVersionOffset = 3;
@@ -16,7 +16,7 @@ inline constexpr std::size_t kBodyLengthOffset = 4;
 inline constexpr std::size_t kSerialOffset = 8;
 inline constexpr std::size_t kFieldsLengthOffset = 12;
 
-// The numbers of the fields behind it.
+// The numbers of the fields that follow the fixed part.
 enum class HeaderField : std::uint8_t {
   kPath = 1,
   kInterface = 2,

@@ -6,7 +6,7 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// The classes of characters that names are made of, one bit each.
+// The classes of characters in names, one bit each: a character is checked with one look-up.
 constexpr std::uint8_t kLetter = 1;  // the underscore counts as one
 constexpr std::uint8_t kDigit = 2;
 constexpr std::uint8_t kHyphen = 4;
@@ -25,10 +25,10 @@ constexpr std::array<std::uint8_t, 256> kClasses = makeClasses();
 struct ElementRules {
   char separator;
   std::uint8_t first;  // classes that an element may start with
-  std::uint8_t rest;   // classes that it may go on with
+  std::uint8_t rest;   // classes of its other characters
 };
 
-// The number of elements that `text` is made of, 0 when one of them breaks the rules.
+// The number of elements of `text`; 0 if one of them breaks the rules.
 std::size_t countElements(std::string_view text, const ElementRules& rules) {
   std::size_t elements = 1;
   bool atStart = true;

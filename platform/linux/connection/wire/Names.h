@@ -3,18 +3,19 @@
 #include <cstddef>
 #include <string_view>
 
-// The rules for the names that a header may carry.
+// The rules of D-Bus for names in a header.
 namespace halvox::platform::linux_::dbus {
 
 inline constexpr std::size_t kMaxNameBytes = 255;
 
-// "/", or "/element/element"; elements are of letters, digits and underscores.
+// "/", or "/element/element". Elements consist of letters, digits and underscores.
 [[nodiscard]] bool isObjectPath(std::string_view text);
-// Two or more elements between dots, none of which starts with a digit. Errors are named so too.
+// Two or more such elements with dots between, none of which starts with a digit. Also the rule for
+// names of errors.
 [[nodiscard]] bool isInterfaceName(std::string_view text);
 // One such element.
 [[nodiscard]] bool isMemberName(std::string_view text);
-// As an interface, where hyphens may be too; or ":" and elements that may start with a digit.
+// As an interface, but hyphens are allowed; or ":" and elements that may start with a digit.
 [[nodiscard]] bool isBusName(std::string_view text);
 
 }  // namespace halvox::platform::linux_::dbus

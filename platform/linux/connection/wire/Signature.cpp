@@ -5,7 +5,7 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// What a character may be in a signature.
+// The role of a character in a signature.
 enum class Role : std::uint8_t { kNone, kBasic, kDescriptor, kVariant };
 
 constexpr std::array<Role, 256> makeRoles() {
@@ -23,8 +23,8 @@ Role roleOf(char code) { return kRoles[static_cast<unsigned char>(code)]; }
 
 bool isBasic(char code) { return roleOf(code) == Role::kBasic || code == 'h'; }
 
-// Walks over complete types and notes on the way what keeps them from being taken. Recursion is
-// bounded by the length of a signature.
+// Goes over complete types, and notes what is unsupported in them. Recursion is bounded by the
+// length of a signature.
 class TypeScanner {
  public:
   explicit TypeScanner(std::string_view text) : text_(text) {}
@@ -64,7 +64,7 @@ class TypeScanner {
     return isBasic(key) && scanType(arrays, structs) && next() == '}';
   }
 
-  // A date is the one struct that is taken.
+  // A date is the only supported struct.
   bool scanStruct(unsigned arrays, unsigned structs) {
     if (text_.substr(position_, 2) != "d)") unsupported_ = true;
     do {
@@ -73,7 +73,7 @@ class TypeScanner {
     return next() == ')';
   }
 
-  std::string_view text_;  // of the caller, who outlives this
+  std::string_view text_;  // of the caller, which outlives this
   std::size_t position_ = 0;
   bool tooDeep_ = false;
   bool unsupported_ = false;
@@ -91,7 +91,7 @@ SignatureShape shapeOfSignature(std::string_view signature) {
 }
 
 SignatureShape shapeOfType(std::string_view type) {
-  // Most types are of one character.
+  // Most types have one character.
   if (type.size() == 1 && roleOf(type.front()) == Role::kBasic) return SignatureShape::kTaken;
   if (type.size() > kMaxSignatureBytes) return SignatureShape::kBroken;
   TypeScanner scanner(type);
@@ -135,7 +135,7 @@ std::size_t alignmentOf(char typeCode) {
     case '(':
     case '{':
       return 8;
-    default:  // y, g, v, and what is no type
+    default:  // y, g, v, and what is not a type
       return 1;
   }
 }

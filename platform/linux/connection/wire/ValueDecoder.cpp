@@ -11,40 +11,16 @@ namespace {
 
 using Kind = DecodeError::Kind;
 
-// More than messages have in all containers that are open at a time; past it the memory that a
-// large message needed is given back.
+// More elements than ordinary messages have in all containers that are open at a time. A scratch
+// that grew beyond gives the memory back.
 constexpr std::size_t kKeptElements = 1024;
 
-// The elements of containers that are not complete yet, innermost last. A thread keeps one, so that
-// containers can be made in their final size without an allocation besides.
-struct Scratch {
-  struct Entry {
-    Entry(std::string_view text, Value content) : key(text), value(std::move(content)) {}
-    Key key;
-    Value value;
-  };
-  std::vector<Value> values;
-  std::vector<Entry> entries;
-
-  void clear() {
-    values.clear();
-    entries.clear();
-    if (values.capacity() > kKeptElements) values.shrink_to_fit();
-    if (entries.capacity() > kKeptElements) entries.shrink_to_fit();
-  }
-};
-
-Scratch& scratchOfThread() {
-  static thread_local Scratch scratch;
-  return scratch;
-}
-
-// Decodes the values of one body. Types that it is given are sound and complete, as the signature
-// of a frame and those of variants are checked before they are used; level is the number of
-// containers around a value.
+// Decodes the values of one body. `type` is always one valid, complete type: the signatures of
+// frames and variants are checked before they are used. `level` is the number of containers around
+// a value.
 class Decoder {
  public:
-  Decoder(const Frame& frame, Scratch& scratch)
+  Decoder(const Frame& frame, DecodeScratch& scratch)
       : reader_(frame.body, frame.header.bigEndian), scratch_(scratch) {}
 
   bool decodeArguments(std::string_view types, std::vector<Value>& arguments);
@@ -72,7 +48,7 @@ class Decoder {
     return (reader_.*read)(text) ? Value(text) : malformed(type);
   }
 
-  // Notes what is wrong and gives no value.
+  // Notes what is wrong, and returns the absent value.
   Value refuse(Kind kind, std::string_view problem, std::string_view signature) {
     failed_ = true;
     kind_ = kind;
@@ -85,8 +61,8 @@ class Decoder {
   }
 
   WireReader reader_;
-  Scratch& scratch_;  // of the thread
-  // Whether and what went wrong, and on the way out of the containers, where.
+  DecodeScratch& scratch_;  // of the caller
+  // What went wrong, and, added on the way out of the containers, where.
   bool failed_ = false;
   Kind kind_ = Kind::kMalformed;
   std::string_view problem_;
@@ -105,7 +81,7 @@ bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& argume
     rest.remove_prefix(type.size());
   }
   if (!reader_.atLimit()) {
-    refuse(Kind::kMalformed, "there are bytes behind the last argument", types);
+    refuse(Kind::kMalformed, "there are bytes after the last argument", types);
   }
   return !failed_;
 }
@@ -143,14 +119,15 @@ Value Decoder::decode(std::string_view type, unsigned level) {
 
 Value Decoder::decodeContainer(std::string_view type, unsigned level) {
   if (level > kMaxNesting) {
-    return refuse(Kind::kUnsupported, "nesting of more than 64 levels is not taken", type);
+    return refuse(Kind::kUnsupported,
+                  "containers nested more than 64 levels deep are not supported", type);
   }
   if (type.front() == 'v') return decodeVariant(level);
   if (type == "ay") return decodeData();
   if (type.starts_with("a{s")) return decodeDictionary(type, level);
   if (type.front() == 'a' && type[1] != '{') return decodeArray(type, level);
   if (type == "(d)") return decodeDate(type);
-  return refuse(Kind::kUnsupported, "values of this signature are not taken", type);
+  return refuse(Kind::kUnsupported, "values of this type are not supported", type);
 }
 
 Value Decoder::decodeBoolean(std::string_view type) {
@@ -170,13 +147,13 @@ Value Decoder::decodeVariant(unsigned level) {
     case SignatureShape::kTaken:
       return decode(type, level);
     case SignatureShape::kUnsupported:
-      return refuse(Kind::kUnsupported, "values of this signature are not taken", type);
+      return refuse(Kind::kUnsupported, "values of this type are not supported", type);
     case SignatureShape::kTooDeep:
-      return refuse(Kind::kUnsupported, "signatures that nest so deep are not taken", type);
+      return refuse(Kind::kUnsupported, "the type is nested too deep to be supported", type);
     case SignatureShape::kBroken:
       break;
   }
-  return refuse(Kind::kMalformed, "a variant whose signature is not valid", type);
+  return refuse(Kind::kMalformed, "the signature of a variant is invalid", type);
 }
 
 Value Decoder::decodeData() {
@@ -215,7 +192,7 @@ Value Decoder::decodeDictionary(std::string_view type, unsigned level) {
 
   Dictionary dictionary;
   dictionary.reserve(scratch_.entries.size() - first);
-  for (Scratch::Entry& entry : std::span(scratch_.entries).subspan(first)) {
+  for (DecodeScratch::Entry& entry : std::span(scratch_.entries).subspan(first)) {
     dictionary.set(entry.key, std::move(entry.value));
   }
   scratch_.entries.erase(scratch_.entries.begin() + static_cast<std::ptrdiff_t>(first),
@@ -224,7 +201,7 @@ Value Decoder::decodeDictionary(std::string_view type, unsigned level) {
 }
 
 void Decoder::decodeEntry(std::string_view type, unsigned level) {
-  // a{s…}: what is between the key's type and the closing brace.
+  // Of a{s…}, what is between the key's type and the closing brace.
   const std::string_view valueType = type.substr(3, type.size() - 4);
   std::string_view key;
   if (!reader_.align(8) || !reader_.readText(key)) {
@@ -256,21 +233,33 @@ DecodeError Decoder::error() const {
 
 DecodeError wrongSignature(std::string_view found, std::string_view expected) {
   DecodeError error{Kind::kWrongSignature, {}, std::string(found), {}};
-  error.message = "the signature of the arguments is \"" + error.signature + "\" where \"";
+  error.message = "the arguments have the signature \"" + error.signature + "\", expected \"";
   error.message += expected;
-  error.message += "\" is expected";
+  error.message += '"';
   return error;
 }
 
 }  // namespace
 
+void DecodeScratch::clear() {
+  values.clear();
+  entries.clear();
+  if (values.capacity() > kKeptElements) values.shrink_to_fit();
+  if (entries.capacity() > kKeptElements) entries.shrink_to_fit();
+}
+
 std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expectedSignature,
                                       std::vector<Value>& arguments) {
+  DecodeScratch scratch;
+  return decodeBody(frame, expectedSignature, arguments, scratch);
+}
+
+std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expectedSignature,
+                                      std::vector<Value>& arguments, DecodeScratch& scratch) {
   arguments.clear();
   if (frame.header.signature != expectedSignature) {
     return wrongSignature(frame.header.signature, expectedSignature);
   }
-  Scratch& scratch = scratchOfThread();
   Decoder decoder(frame, scratch);
   std::optional<DecodeError> error;
   if (!decoder.decodeArguments(expectedSignature, arguments)) {

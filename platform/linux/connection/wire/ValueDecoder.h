@@ -4,6 +4,7 @@
 #include <optional>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "platform/linux/connection/wire/Frame.h"
@@ -11,40 +12,62 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// Why the body of a message was not taken.
+// Why the body of a message could not be decoded.
 struct DecodeError {
   enum class Kind : std::uint8_t {
-    kMalformed,       // the bytes break the rules of the wire: the connection cannot go on
-    kUnsupported,     // a sound message with a value that we have no form for
-    kWrongSignature,  // a sound message whose arguments are not the ones asked for
+    kMalformed,       // the bytes break the rules of the wire; the connection must be closed
+    kUnsupported,     // a valid message with a value of an unsupported type
+    kWrongSignature,  // a valid message whose arguments are not the expected ones
   };
   Kind kind = Kind::kMalformed;
-  // Where it happened: the number of the argument, counted from 1, and the path of dictionary keys
-  // and element numbers (from 0) inside it, as in `argument 1, key "a"."b"[3]`. Long keys are cut.
-  // Empty for a wrong signature.
+  // The place of the value: the number of the argument, counted from 1, and the path of dictionary
+  // keys and element numbers (from 0) inside it, as in `argument 1, key "a"."b"[3]`. Long keys are
+  // cut. Empty for a wrong signature.
   std::string key;
-  // The signature of the value there; empty when it is not known. May be cut when malformed.
+  // The signature of the value; empty if it is not known. Cut if it is malformed and long.
   std::string signature;
-  // One line of valid UTF-8 that names both; fit for the log and for the answer to the client.
+  // One line of valid UTF-8 with both, for the log and for the answer to the client.
   std::string message;
 };
 
+// The elements of containers that are being decoded, innermost last. Arrays and dictionaries have
+// their final size when they are made, which is known only after their last element: without this,
+// a container would be allocated twice. Whoever decodes many bodies keeps one, and its capacity,
+// for all of them. Belongs to one thread. Empty between calls.
+struct DecodeScratch {
+  struct Entry {
+    Entry(std::string_view text, Value content) : key(text), value(std::move(content)) {}
+    Key key;
+    Value value;
+  };
+  std::vector<Value> values;
+  std::vector<Entry> entries;
+
+  // Gives memory back that only an unusually large message needed.
+  void clear();
+};
+
 // Decodes the body of a frame, whose arguments must have exactly the expected signature, into
-// `arguments` (whatever was in there is dropped; empty after an error).
+// `arguments`. Replaces their content; they are empty after an error.
 //
 //   y n q i u x t, d, b  numbers of that kind (NaN and infinities too)
 //   s o g                strings
 //   ay                   data
 //   (d)                  a date, seconds since 1970
-//   a{s…}                a dictionary; of entries with the same key the last one counts
+//   a{s…}                a dictionary; of entries with the same key the last one is kept
 //   a…                   an array
 //   v                    the value inside
 //
 // Everything else is unsupported: file descriptors, other structs, dictionaries with other keys
-// (also when an array of these is empty), and nesting of more than kMaxNesting levels.
+// (even an empty array of these), and nesting of more than kMaxNesting levels.
 //
-// Takes time and memory in proportion to the size of the frame at worst, and allocates nothing but
-// the values. Any thread may call it.
+// Time and memory are at worst proportional to the size of the frame. Allocates the values only,
+// once `arguments` and `scratch` have their capacity. Any thread may call it.
+[[nodiscard]] std::optional<DecodeError> decodeBody(const Frame& frame,
+                                                    std::string_view expectedSignature,
+                                                    std::vector<Value>& arguments,
+                                                    DecodeScratch& scratch);
+// The same with a scratch of its own, for occasional messages.
 [[nodiscard]] std::optional<DecodeError> decodeBody(const Frame& frame,
                                                     std::string_view expectedSignature,
                                                     std::vector<Value>& arguments);

@@ -46,7 +46,7 @@ TEST(ValueDecoderTest, OtherSignaturesThanTheExpectedOneAreToldApart) {
 
   ASSERT_TRUE(error.has_value());
   EXPECT_EQ(error->kind, Kind::kWrongSignature);
-  EXPECT_EQ(error->message, "the signature of the arguments is \"x\" where \"qx\" is expected");
+  EXPECT_EQ(error->message, "the arguments have the signature \"x\", expected \"qx\"");
 }
 
 TEST(ValueDecoderTest, LastOfEntriesWithOneKeyCounts) {
@@ -66,7 +66,7 @@ TEST(ValueDecoderTest, UnsupportedValuesAreNamedWithKeyAndSignature) {
   EXPECT_EQ(error->key, "argument 1, key \"socket\"");
   EXPECT_EQ(error->signature, "h");
   EXPECT_EQ(error->message,
-            "argument 1, key \"socket\": values of this signature are not taken "
+            "argument 1, key \"socket\": values of this type are not supported "
             "(signature \"h\")");
 }
 
@@ -230,7 +230,7 @@ TEST(ValueDecoderTest, MalformedMessagesNameTheByte) {
   ASSERT_TRUE(error.has_value());
   EXPECT_EQ(error->key, "argument 1, key \"name\"");
   EXPECT_EQ(error->message,
-            "argument 1, key \"name\": text that is not UTF-8 or has a NUL in it "
+            "argument 1, key \"name\": the text is not valid UTF-8 or contains a NUL "
             "(signature \"s\", byte 26 of the body)");
 }
 

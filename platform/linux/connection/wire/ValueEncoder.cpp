@@ -13,8 +13,8 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// Arrays in arrays deeper than this are written as arrays of variants, so that finding out whether
-// all elements have one type takes a bounded number of looks at each.
+// Arrays nested deeper than this are written as arrays of variants. Finding out whether all
+// elements have one type looks at each element once for each array around it; this bounds that.
 constexpr unsigned kMaxUniformNesting = 8;
 
 template <typename Number>
@@ -55,8 +55,7 @@ char naturalCode(NumberKind kind) {
 
 std::string naturalType(const Value& value, unsigned arrays);
 
-// The type of an array whose elements have one type; of any other, or an empty one, that with
-// variants.
+// The type of an array whose elements have one type. `av` for any other and for an empty array.
 std::string naturalArrayType(const Array& array, unsigned arrays) {
   if (array.empty() || arrays > kMaxUniformNesting) return "av";
   const std::string first = naturalType(array[0], arrays);
@@ -66,7 +65,7 @@ std::string naturalArrayType(const Array& array, unsigned arrays) {
   return uniform && !first.empty() ? "a" + first : "av";
 }
 
-// Empty for no value. `arrays` is the number of arrays around the value.
+// Empty for the absent value. `arrays` is the number of arrays around the value.
 std::string naturalType(const Value& value, unsigned arrays) {
   switch (value.kind()) {
     case ValueKind::kNone:

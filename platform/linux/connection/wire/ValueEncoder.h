@@ -12,20 +12,20 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// Appends numbers, texts and values in wire form, little endian, to a buffer in which a message
-// starts at `start`: boundaries are counted from there. The buffer is the caller's and outlives
+// Appends numbers, texts and values in wire format, little endian, to a buffer in which a message
+// starts at `start`. Alignment counts from there. The caller owns the buffer, which must outlive
 // this.
 class ValueEncoder {
  public:
   ValueEncoder(std::string& out, std::size_t start) : out_(out), start_(start) {}
 
-  // Appends one value for each type of a signature. False when a value has no form in its type, or
-  // there are more of one than of the other; what was appended until then is left in the buffer.
+  // Appends one value for each type of a signature. False if a value does not fit its type, or if
+  // the numbers of values and types differ; what was appended until then stays in the buffer.
   // FrameWriter.h has the rules.
   [[nodiscard]] bool appendAll(std::string_view signature, std::span<const Value> values);
 
   void align(std::size_t alignment);
-  // A number at its natural boundary.
+  // Appends padding, then the number: the alignment of a number is its size.
   template <typename Number>
   void appendNumber(Number number) {
     align(sizeof number);
@@ -35,10 +35,10 @@ class ValueEncoder {
       std::reverse(bytes, bytes + sizeof bytes);
     out_.append(bytes, sizeof bytes);
   }
-  // Their characters are not looked at.
+  // These two do not check the characters.
   void appendText(std::string_view text);
   void appendSignature(std::string_view signature);
-  // Writes over a number that is already there.
+  // Overwrites a length that was appended as 0.
   void replaceLength(std::size_t position, std::size_t length);
 
  private:

@@ -43,13 +43,13 @@ bool skipVariant(WireReader& reader, unsigned level) {
   if (!reader.readVariantSignature(type)) return false;
   const SignatureShape shape = shapeOfType(type);
   if (shape == SignatureShape::kBroken || shape == SignatureShape::kTooDeep) {
-    return reader.fail("a variant whose signature is not valid");
+    return reader.fail("the signature of a variant is invalid");
   }
   return skip(reader, type, level);
 }
 
 bool skipContainer(WireReader& reader, std::string_view type, unsigned level) {
-  if (level > kMaxNesting) return reader.fail("nesting of more than 64 levels");
+  if (level > kMaxNesting) return reader.fail("containers are nested more than 64 levels deep");
   if (type.front() == 'v') return skipVariant(reader, level);
   if (type.front() == 'a') return skipArray(reader, type.substr(1), level);
   return skipMembers(reader, type.substr(1, type.size() - 2), level);

@@ -6,9 +6,8 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// Goes over one value of any sound type, checking it as the wire demands and keeping nothing.
-// False when it breaks a rule, nests deeper than kMaxNesting among them; the reader has the
-// problem.
+// Skips one value of any valid type, and checks it by the rules of the wire. False if it breaks a
+// rule, including the limit of kMaxNesting levels; the reader then has the problem.
 [[nodiscard]] bool skipValue(WireReader& reader, std::string_view type);
 
 }  // namespace halvox::platform::linux_::dbus

@@ -9,25 +9,25 @@ namespace halvox::platform::linux_::dbus {
 bool WireReader::readBoolean(bool& boolean) {
   std::uint32_t number = 0;
   if (!read(number)) return false;
-  if (number > 1) return fail("a boolean that is neither 0 nor 1");
+  if (number > 1) return fail("the boolean is neither 0 nor 1");
   boolean = number == 1;
   return true;
 }
 
 bool WireReader::readPath(std::string_view& path) {
   if (!readUncheckedText(path)) return false;
-  return isObjectPath(path) || fail("an object path that is not valid");
+  return isObjectPath(path) || fail("the object path is invalid");
 }
 
 bool WireReader::readSignature(std::string_view& signature) {
   if (!readVariantSignature(signature)) return false;
-  return isSignature(signature) || fail("a signature that is not valid");
+  return isSignature(signature) || fail("the signature is invalid");
 }
 
 bool WireReader::enterArray(std::size_t elementAlignment, std::size_t& outerLimit) {
   std::uint32_t length = 0;
   if (!read(length)) return false;
-  if (length > kMaxArrayBytes) return fail("an array of more than 64 MiB");
+  if (length > kMaxArrayBytes) return fail("the array is longer than 64 MiB");
   if (!align(elementAlignment)) return false;
   if (length > limit_ - position_) return fail(kEndsTooEarly);
   outerLimit = limit_;

@@ -10,11 +10,14 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// Reads the basic types of the wire one after the other from bytes whose first one stands on an
-// 8-byte boundary of the message, with all checks that concern a single value.
+// Reads the basic types of the wire, one after the other, with all checks that concern a single
+// value. The first byte must be on an 8-byte boundary of the message.
 //
-// Every read… returns false when the bytes break a rule; `problem()` then says which, and the
-// reader is of no further use. Texts that it gives point into the bytes, whose owner is the caller.
+// Each read… function returns false if the bytes break a rule. `problem()` then says which, and the
+// reader must not be used further. Texts point into the bytes, which the caller owns.
+//
+// Problems are constants: the reader allocates nothing, and hostile bytes cannot get into its
+// texts.
 class WireReader {
  public:
   WireReader(std::span<const std::byte> bytes, bool bigEndian)
@@ -26,13 +29,13 @@ class WireReader {
   [[nodiscard]] bool atLimit() const { return position_ == limit_; }
   [[nodiscard]] std::string_view problem() const { return problem_; }
 
-  // Notes what is wrong, and returns false.
+  // Notes the problem, and returns false.
   bool fail(std::string_view problem) {
     problem_ = problem;
     return false;
   }
 
-  // Goes on at the next such boundary. Padding must be zero.
+  // Skips padding, which must be zero, up to the next multiple of `alignment`.
   bool align(std::size_t alignment) {
     const std::size_t aligned = (position_ + alignment - 1) & ~(alignment - 1);
     if (aligned > limit_) return fail(kEndsTooEarly);
@@ -43,7 +46,7 @@ class WireReader {
     return true;
   }
 
-  // A number at its natural boundary.
+  // Skips padding, then reads a number: the alignment of a number is its size.
   template <typename Number>
   bool read(Number& number) {
     if (!align(sizeof number)) return false;
@@ -59,31 +62,32 @@ class WireReader {
   bool readBoolean(bool& boolean);
   bool readText(std::string_view& text) {
     if (!readUncheckedText(text)) return false;
-    return isUtf8WithoutNul(text) || fail("text that is not UTF-8 or has a NUL in it");
+    return isUtf8WithoutNul(text) || fail("the text is not valid UTF-8 or contains a NUL");
   }
-  // A text whose characters the caller checks by a stricter rule.
+  // A text without a check of its characters, for callers with a stricter rule.
   bool readUncheckedText(std::string_view& text) {
     std::uint32_t length = 0;
     return read(length) && takeTerminated(length, text);
   }
   bool readPath(std::string_view& path);
   bool readSignature(std::string_view& signature);
-  // The signature of a variant, whose grammar is not looked at.
+  // The signature of a variant, without a check of its grammar.
   bool readVariantSignature(std::string_view& signature) {
     std::uint8_t length = 0;
     return read(length) && takeTerminated(length, signature);
   }
 
-  // Reads the length of an array of elements with that alignment and goes to the first of them.
-  // Until leaveArray(), nothing can be read past the end of the array.
+  // Reads the length of an array whose elements have that alignment, and skips to the first
+  // element. Until leaveArray(), nothing can be read beyond the end of the array.
   bool enterArray(std::size_t elementAlignment, std::size_t& outerLimit);
   void leaveArray(std::size_t outerLimit) { limit_ = outerLimit; }
-  // All that is left of the array.
+  // The remaining bytes of the array.
   std::span<const std::byte> takeRest();
 
  private:
   static constexpr bool kHostIsBigEndian = __BYTE_ORDER__ == __ORDER_BIG_ENDIAN__;
-  static constexpr std::string_view kEndsTooEarly = "the bytes end within it";
+  static constexpr std::string_view kEndsTooEarly =
+      "the value continues beyond the end of its container or of the message";
 
   template <std::size_t kSize>
   struct BitsOfSize;
@@ -97,7 +101,7 @@ class WireReader {
 
   bool takeTerminated(std::size_t length, std::string_view& text) {
     if (limit_ - position_ <= length) return fail(kEndsTooEarly);
-    if (bytes_[position_ + length] != '\0') return fail("its end is not marked by a NUL");
+    if (bytes_[position_ + length] != '\0') return fail("the text does not end with a NUL");
     text = {bytes_ + position_, length};
     position_ += length + 1;
     return true;
