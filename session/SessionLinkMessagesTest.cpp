@@ -2,7 +2,6 @@
 #include <memory>
 #include <optional>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include <gmock/gmock.h>
@@ -20,8 +19,6 @@ using testing::UnorderedElementsAre;
 using namespace std::chrono_literals;
 
 class SessionLinkMessagesTest : public LinkFixture {};
-
-// --- messages -----------------------------------------------------------------------------------
 
 TEST_F(SessionLinkMessagesTest, MessagesThatWaitedAreSentInOrder) {
   holdDiscoveries();
@@ -291,159 +288,6 @@ TEST_F(SessionLinkMessagesTest, WhatWaitsStaysChargedWhenTheSessionIsStopped) {
   session_.reset();
   platform_.dispatch.advance(9s);
   EXPECT_EQ(account->use().bytes, 0U);
-}
-
-// --- stop ---------------------------------------------------------------------------------------
-
-TEST_F(SessionLinkMessagesTest, StopFlushesAfterAllMessages) {
-  open();
-  send({{"a", 1}});
-  platform_.journal.clear();
-
-  stop();
-
-  EXPECT_THAT(frameworkSteps(),
-              ElementsAre("send session 1 4/1", "send session 1 65535/65535", "flush session 1"));
-  EXPECT_TRUE(holdsNothing());
-  EXPECT_EQ(framework_.liveSessions(), 0U);
-}
-
-TEST_F(SessionLinkMessagesTest, StopLogsAroundTheFlush) {
-  open();
-  framework_.answerFlushes(Fake::Answering::kWhenTold);
-  linkLines();
-
-  stop();
-  EXPECT_THAT(linkLines(), ElementsAre(kStopEntered));
-
-  framework_.completeFlush();
-  run();
-  EXPECT_THAT(linkLines(), ElementsAre(kClosed));
-}
-
-TEST_F(SessionLinkMessagesTest, TheSessionOfTheFrameworkStaysUntilItIsFlushed) {
-  open();
-  framework_.answerFlushes(Fake::Answering::kWhenTold);
-
-  stop();
-  platform_.dispatch.advance(1h);
-  EXPECT_NE(session_->link().tlmReportingSession(), nullptr);
-  EXPECT_TRUE(session_->link().tlmReportingSessionStarted());
-
-  framework_.completeFlush();
-  run();
-  EXPECT_TRUE(holdsNothing());
-  EXPECT_FALSE(session_->link().tlmReportingSessionStarted());
-}
-
-TEST_F(SessionLinkMessagesTest, WhileAFlushIsOutNothingElseOfTheLinkRuns) {
-  open();
-  framework_.answerFlushes(Fake::Answering::kWhenTold);
-  stop();
-  session_->start();
-  send({{"a", 1}});
-  run();
-  EXPECT_EQ(framework_.sessions().size(), 1U);
-
-  framework_.completeFlush();
-  run();
-  EXPECT_EQ(framework_.sessions().size(), 2U);
-  EXPECT_EQ(framework_.messages().back().session, 2U);
-}
-
-TEST_F(SessionLinkMessagesTest, AFlushTakesNoSignalOfADiscovery) {
-  holdDiscoveries();
-  start();
-  platform_.dispatch.advance(9s);
-  framework_.answerDiscovery(kServers);  // too late: the signal remains
-  stop();
-  framework_.answerFlushes(Fake::Answering::kWhenTold);
-  holdDiscoveries();
-  start();  // consumes the signal and gives up
-  stop();   // has nothing to flush
-  framework_.answerDiscovery(kServers);
-
-  start();
-  EXPECT_EQ(framework_.waitingFlushes(), 0U);
-  EXPECT_EQ(framework_.sessions().size(), 3U);
-}
-
-TEST_F(SessionLinkMessagesTest, StopWithoutAFrameworkSessionFlushesNothing) {
-  start();
-  linkLines();
-  platform_.journal.clear();
-
-  stop();
-
-  EXPECT_THAT(frameworkSteps(), IsEmpty());
-  EXPECT_THAT(linkLines(), ElementsAre(kStopEntered, kClosed));
-}
-
-TEST_F(SessionLinkMessagesTest, StopDuringTheWaitClosesTheLinkAfterIt) {
-  holdDiscoveries();
-  start();
-  session_->stop();
-  run();
-  linkLines();
-
-  framework_.answerDiscovery(kServers);
-  run();
-
-  EXPECT_THAT(linkLines(), ElementsAre(kList, kContinuing, kStopEntered, kClosed));
-  EXPECT_EQ(frameworkSteps().back(), "flush session 1");
-}
-
-TEST_F(SessionLinkMessagesTest, ASessionCanBeStartedAgainWithANewFrameworkSession) {
-  open();
-  stop();
-
-  start();
-  send({{"a", 1}});
-  run();
-
-  EXPECT_EQ(framework_.tokens().size(), 2U);
-  EXPECT_EQ(framework_.messages().back().session, 2U);
-}
-
-TEST_F(SessionLinkMessagesTest, ASessionThatWaitsDelaysNoOther) {
-  holdDiscoveries();
-  start();
-  framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
-  const auto other =
-      std::make_shared<HVReportingSession>(ReporterID{8}, HVReportingSession::ProcessIdentifiers{});
-  other->setTlmReportingEnabled(true);
-
-  other->start();
-  other->sendMessage(Dictionary{{"a", 1}}, kPlayback, kStart, nullptr);
-  run();
-
-  EXPECT_EQ(framework_.messages().size(), 1U);
-  EXPECT_EQ(framework_.messages().at(0).session, 2U);
-}
-
-TEST_F(SessionLinkMessagesTest, TheLastJobKeepsTheSessionUntilItIsFlushed) {
-  open();
-  framework_.answerFlushes(Fake::Answering::kWhenTold);
-  stop();
-  const std::weak_ptr<HVReportingSession> session = session_;
-  session_.reset();
-  EXPECT_FALSE(session.expired());
-
-  framework_.completeFlush();
-  run();
-
-  EXPECT_TRUE(session.expired());
-}
-
-// For ThreadSanitizer: the discovery answers on a thread of the framework.
-TEST_F(SessionLinkMessagesTest, DiscoveryMayAnswerOnAnotherThread) {
-  holdDiscoveries();
-  start();
-
-  std::thread([this] { framework_.answerDiscovery(kServers); }).join();
-  run();
-
-  EXPECT_EQ(linkLines().back(), kContinuing);
 }
 
 }  // namespace
