@@ -92,7 +92,7 @@ class UnitLog {
   // The first part of a line. It also carries the line number of the call.
   struct Text {
     // std::source_location does the same, but the standard library of clang 14 does not have it.
-    // NOLINTNEXTLINE(google-explicit-constructor): call sites read as plain text
+    // Implicit: call sites read as plain text.
     Text(const char* first, std::uint32_t where = __builtin_LINE()) : text(first), line(where) {}
     const char* text;
     std::uint32_t line;

@@ -170,8 +170,8 @@ class Value {
     other.setTag(Tag::kNone);
   }
   // The new content is taken before the old one is released: `other` may be this value or be inside
-  // it.
-  Value& operator=(const Value& other) noexcept {  // NOLINT(bugprone-unhandled-self-assignment)
+  // it. NOLINTNEXTLINE(bugprone-unhandled-self-assignment): the copy handles it
+  Value& operator=(const Value& other) noexcept {
     Value taken(other);
     std::swap(storage_, taken.storage_);
     return *this;
