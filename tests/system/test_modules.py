@@ -33,6 +33,11 @@ def heavy(service):
     return [library for library in HEAVY if any(name.startswith(library) for name in names)]
 
 
+def wait_for_line(service, pattern):
+    """The log has a thread of its own: a service may be ready before its lines are written."""
+    wait_for(f"the line {pattern}", lambda: re.search(pattern, service.log()))
+
+
 class ModulesTest(unittest.TestCase):
     def service(self, config="", **options):
         service = Service(config, **options)
@@ -54,7 +59,7 @@ class ModulesTest(unittest.TestCase):
         service = self.service().start()
 
         self.assertEqual(heavy(service), [])
-        self.assertIn("traces: none, features.Acoustat.Tracing is not true", service.log())
+        wait_for_line(service, "traces: none, features.Acoustat.Tracing is not true")
 
     def test_the_link_to_nats_is_loaded_when_it_is_configured(self):
         self.require(NATS)
@@ -69,7 +74,7 @@ class ModulesTest(unittest.TestCase):
         service = self.service(TRACING_CONFIG).start()
 
         self.assertEqual(heavy(service), ["libbabeltrace2", "liblttng-ctl", TRACING])
-        self.assertIn("traces: LTTng", service.log())
+        wait_for_line(service, "traces: LTTng")
 
     def test_the_tracer_is_loaded_when_an_earlier_service_left_a_recording(self):
         self.require(TRACING)
@@ -139,12 +144,11 @@ class MissingModulesTest(unittest.TestCase):
         service = self.service(TRACING_CONFIG).start()
 
         self.assert_serves(service)
-        log = service.log()
-        self.assertRegex(log, "trace points: none, halvox-kdebug-lttng.so: .*No such file")
-        self.assertRegex(log, r"traces: none, features.Acoustat.Tracing = true needs "
-                              r"halvox-tracing-lttng.so: .*No such file")
-        self.assertRegex(log, r"drivers.pipewire = true needs halvox-drivers-pipewire.so: .*No such "
-                              r"file.*; PipeWire's counters are disabled until the next start")
+        wait_for_line(service, "trace points: none, halvox-kdebug-lttng.so: .*No such file")
+        wait_for_line(service, "traces: none, features.Acoustat.Tracing = true needs "
+                               "halvox-tracing-lttng.so: .*No such file")
+        wait_for_line(service, "drivers.pipewire = true needs halvox-drivers-pipewire.so: .*No such "
+                               "file.*; PipeWire's counters are disabled until the next start")
 
     def test_the_link_to_nats_without_its_module_is_an_error(self):
         service = self.service(NATS_CONFIG)
