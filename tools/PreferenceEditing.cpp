@@ -27,7 +27,6 @@ using platform::linux_::Result;
 using platform::linux_::shownName;
 using platform::linux_::toDictionary;
 using platform::linux_::toValue;
-using platform::linux_::Utf8Step;
 
 using Edited = Result<std::string>;
 
