@@ -2,7 +2,6 @@
 
 #include <filesystem>
 #include <utility>
-#include <variant>
 
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
 #include "platform/linux/drivers/ConfiguredSources.h"
@@ -43,10 +42,8 @@ SnapshotOptions snapshotOptions(const Configuration& configuration) {
 
 std::unique_ptr<KdebugService> makeKdebug(std::string& failure) {
   auto loaded = LttngKdebugService::load();
-  if (auto* service = std::get_if<std::unique_ptr<KdebugService>>(&loaded)) {
-    return std::move(*service);
-  }
-  failure = std::get<std::string>(loaded);
+  if (loaded) return *std::move(loaded);
+  failure = std::move(loaded).error().message;
   return std::make_unique<NoKdebugService>();
 }
 
@@ -62,10 +59,8 @@ std::unique_ptr<NatsTlmReporting> makeNats(const Configuration::Link& options,
                                            std::string& failure) {
   if (options.backend != LinkBackend::kNats) return nullptr;
   auto loaded = loadNatsTlmReporting(options, environment);
-  if (auto* link = std::get_if<std::unique_ptr<NatsTlmReporting>>(&loaded)) {
-    return std::move(*link);
-  }
-  failure = std::get<std::string>(loaded);
+  if (loaded) return *std::move(loaded);
+  failure = std::move(loaded).error().message;
   return nullptr;
 }
 

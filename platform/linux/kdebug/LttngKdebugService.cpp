@@ -8,14 +8,14 @@
 
 namespace halvox::platform::linux_ {
 
-std::variant<std::unique_ptr<KdebugService>, std::string> LttngKdebugService::load() {
+Result<std::unique_ptr<KdebugService>> LttngKdebugService::load() {
   // LTTng would otherwise wait three seconds at the start for a session daemon that does not
   // answer.
   ::setenv("LTTNG_UST_REGISTER_TIMEOUT", "0", /*replace=*/0);
   auto loaded = loadEntryPoint<std::remove_pointer_t<Emit>>(
       {"halvox-kdebug-lttng.so", "halvox_kdebug_lttng_1"});
-  if (auto* why = std::get_if<std::string>(&loaded)) return std::move(*why);
-  return std::unique_ptr<KdebugService>(new LttngKdebugService(std::get<Emit>(loaded)));
+  if (!loaded) return std::move(loaded).error();
+  return std::unique_ptr<KdebugService>(new LttngKdebugService(*loaded));
 }
 
 void LttngKdebugService::kdebug_trace(std::uint32_t code, std::uint64_t argument1,

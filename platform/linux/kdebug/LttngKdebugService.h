@@ -3,9 +3,9 @@
 #include <cstdint>
 #include <memory>
 #include <string>
-#include <variant>
 
 #include "platform/kdebug.h"
+#include "platform/linux/base/Result.h"
 
 namespace halvox::platform::linux_ {
 
@@ -29,9 +29,9 @@ class NoKdebugService final : public KdebugService {
 // NoKdebugService.
 class LttngKdebugService final : public KdebugService {
  public:
-  // The service, or a text with the reason why its module cannot be loaded. Call it before other
+  // The service, or the reason why its module cannot be loaded. Call it before other
   // threads start: it may set an environment variable, which is not thread-safe.
-  static std::variant<std::unique_ptr<KdebugService>, std::string> load();
+  static Result<std::unique_ptr<KdebugService>> load();
 
   void kdebug_trace(std::uint32_t code, std::uint64_t argument1, std::uint64_t argument2,
                     std::uint64_t argument3, std::uint64_t argument4) override;

@@ -1,5 +1,6 @@
 #include "platform/linux/modules/Module.h"
 
+#include <string>
 #include <string_view>
 #include <system_error>
 
@@ -29,25 +30,24 @@ std::filesystem::path modulePath(const Module& module) {
   return (directory / HALVOX_MODULES_FROM_PROGRAM / module.file).lexically_normal();
 }
 
-std::variant<void*, std::string> loadModule(const Module& module) {
-  return loadModule(module, modulePath(module));
-}
+Result<void*> loadModule(const Module& module) { return loadModule(module, modulePath(module)); }
 
-std::variant<void*, std::string> loadModule(const Module& module,
-                                            const std::filesystem::path& path) {
-  const std::string prefix = std::string(module.file) + ": ";
+Result<void*> loadModule(const Module& module, const std::filesystem::path& path) {
+  const auto failure = [&](const std::string& why) {
+    return Failure<>{std::string(module.file) + ": " + why};
+  };
   // Now: a symbol that the program does not have is an error here, and not the end of the process
   // at the first call.
   void* const library = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
-  if (library == nullptr) return prefix + lastError();
+  if (library == nullptr) return failure(lastError());
   const auto* const version = static_cast<const char*>(::dlsym(library, kVersionSymbol));
-  if (version == nullptr) return prefix + path.native() + " is not a module of this service";
+  if (version == nullptr) return failure(path.native() + " is not a module of this service");
   if (std::string_view(version) != halvoxVersion()) {
-    return prefix + path.native() + " is of version " + version + ", the service is of version " +
-           halvoxVersion() + "; install both from one build";
+    return failure(path.native() + " is of version " + version + ", the service is of version " +
+                   halvoxVersion() + "; install both from one build");
   }
   void* const entryPoint = ::dlsym(library, module.entryPoint);
-  if (entryPoint == nullptr) return prefix + lastError();
+  if (entryPoint == nullptr) return failure(lastError());
   return entryPoint;
 }
 

@@ -1,8 +1,9 @@
 #pragma once
 
 #include <filesystem>
-#include <string>
-#include <variant>
+#include <utility>
+
+#include "platform/linux/base/Result.h"
 
 namespace halvox::platform::linux_ {
 
@@ -23,17 +24,16 @@ struct Module {
 // service is refused, because the classes that both share may differ. The module stays loaded until
 // the process ends: its libraries have threads, and objects of the service refer to its code.
 // Blocks for the disk. Any thread may call.
-[[nodiscard]] std::variant<void*, std::string> loadModule(const Module& module);
+[[nodiscard]] Result<void*> loadModule(const Module& module);
 // The same for the module at that path.
-[[nodiscard]] std::variant<void*, std::string> loadModule(const Module& module,
-                                                          const std::filesystem::path& path);
+[[nodiscard]] Result<void*> loadModule(const Module& module, const std::filesystem::path& path);
 
 // The same, for an entry point of that type.
 template <typename Function>
-[[nodiscard]] std::variant<Function*, std::string> loadEntryPoint(const Module& module) {
-  auto loaded = loadModule(module);
-  if (auto* why = std::get_if<std::string>(&loaded)) return std::move(*why);
-  return reinterpret_cast<Function*>(std::get<void*>(loaded));
+[[nodiscard]] Result<Function*> loadEntryPoint(const Module& module) {
+  Result<void*> loaded = loadModule(module);
+  if (!loaded) return std::move(loaded).error();
+  return reinterpret_cast<Function*>(*loaded);
 }
 
 }  // namespace halvox::platform::linux_

@@ -3,7 +3,6 @@
 #include <filesystem>
 #include <fstream>
 #include <string>
-#include <variant>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -21,16 +20,15 @@ constexpr Module kPlain{"halvox-test-module.so", "halvox_plain_module_2"};
 
 // Why the module cannot be loaded; empty when it can.
 template <typename Entry>
-std::string reason(const std::variant<Entry, std::string>& loaded) {
-  const auto* why = std::get_if<std::string>(&loaded);
-  return why == nullptr ? std::string() : *why;
+std::string reason(const Result<Entry>& loaded) {
+  return loaded ? std::string() : loaded.error().message;
 }
 
 TEST(ModuleTest, EntryPointOfAModuleBesideTheProgramIsCalled) {
   const auto loaded = loadEntryPoint<int()>(kPlain);
 
   ASSERT_EQ(reason(loaded), "");
-  EXPECT_EQ(std::get<int (*)()>(loaded)(), 42);
+  EXPECT_EQ((*loaded)(), 42);
 }
 
 TEST(ModuleTest, ModuleThatIsNotBesideTheProgramIsLookedForWhereItIsInstalled) {

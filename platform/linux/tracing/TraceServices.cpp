@@ -2,7 +2,6 @@
 
 #include <system_error>
 #include <utility>
-#include <variant>
 
 #include "platform/linux/tracing/NoTraceServices.h"
 #include "platform/linux/tracing/lttng/TracingEntryPoint.h"
@@ -16,11 +15,10 @@ std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options,
     return makeNoTraceServices("features.Acoustat.Tracing is not true");
   }
   auto loaded = loadEntryPoint<decltype(halvox_tracing_lttng_1)>(kTracingModule);
-  if (auto* why = std::get_if<std::string>(&loaded)) {
-    return makeNoTraceServices("features.Acoustat.Tracing = true needs " + *why);
+  if (!loaded) {
+    return makeNoTraceServices("features.Acoustat.Tracing = true needs " + loaded.error().message);
   }
-  return std::unique_ptr<TraceServices>(
-      std::get<decltype(&halvox_tracing_lttng_1)>(loaded)(directory, statistics));
+  return std::unique_ptr<TraceServices>((*loaded)(directory, statistics));
 }
 
 bool hasTraceLeftovers(const std::filesystem::path& tracesDirectory) {

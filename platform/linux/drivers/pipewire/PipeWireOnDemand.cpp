@@ -4,7 +4,6 @@
 #include <filesystem>
 #include <string>
 #include <system_error>
-#include <variant>
 
 #include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/pipewire/NodeChannel.h"
@@ -60,13 +59,13 @@ void PipeWireOnDemand::sampled() {
 
 void PipeWireOnDemand::load(std::chrono::milliseconds longestOpening) {
   const auto loaded = loadEntryPoint<decltype(halvox_drivers_pipewire_1)>(kPipeWireModule);
-  if (const auto* why = std::get_if<std::string>(&loaded)) {
+  if (!loaded) {
     isDisabled_ = true;
-    kLog.error("drivers.pipewire = true needs ", *why,
+    kLog.error("drivers.pipewire = true needs ", loaded.error().message,
                "; PipeWire's counters are disabled until the next start");
     return;
   }
-  source_.reset(std::get<decltype(&halvox_drivers_pipewire_1)>(loaded)(longestOpening));
+  source_.reset((*loaded)(longestOpening));
   source_->open();
 }
 

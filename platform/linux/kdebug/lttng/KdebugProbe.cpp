@@ -5,20 +5,18 @@
 #include <memory>
 #include <string>
 #include <utility>
-#include <variant>
 
 #include "platform/linux/kdebug/LttngKdebugService.h"
 
 int main() {
-  using halvox::platform::KdebugService;
   using halvox::platform::linux_::LttngKdebugService;
 
   auto loaded = LttngKdebugService::load();
-  if (const auto* reason = std::get_if<std::string>(&loaded)) {
-    std::cerr << *reason << '\n';
+  if (!loaded) {
+    std::cerr << loaded.error().message << '\n';
     return 1;
   }
-  const auto service = std::get<std::unique_ptr<KdebugService>>(std::move(loaded));
+  const auto service = *std::move(loaded);
   std::cout << "ready" << std::endl;
   constexpr std::uint32_t kFirstCode = 0x21044814;
   constexpr std::uint32_t kStep = 4;

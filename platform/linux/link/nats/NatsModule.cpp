@@ -4,12 +4,11 @@
 
 namespace halvox::platform::linux_ {
 
-std::variant<std::unique_ptr<NatsTlmReporting>, std::string> loadNatsTlmReporting(
-    const Configuration::Link& options, const NatsEnvironment& environment) {
+Result<std::unique_ptr<NatsTlmReporting>> loadNatsTlmReporting(const Configuration::Link& options,
+                                                               const NatsEnvironment& environment) {
   auto loaded = loadEntryPoint<decltype(halvox_link_nats_1)>(kNatsModule);
-  if (auto* why = std::get_if<std::string>(&loaded)) return std::move(*why);
-  return std::unique_ptr<NatsTlmReporting>(
-      std::get<decltype(&halvox_link_nats_1)>(loaded)(options, environment));
+  if (!loaded) return std::move(loaded).error();
+  return std::unique_ptr<NatsTlmReporting>((*loaded)(options, environment));
 }
 
 }  // namespace halvox::platform::linux_
