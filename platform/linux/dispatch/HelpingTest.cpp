@@ -27,8 +27,13 @@ using ThreadIDs = std::vector<std::thread::id>;
 
 class HelpingTest : public ::testing::Test {
  protected:
+  // A queue whose own thread sleeps. A thread that is still starting looks for jobs by itself and
+  // may run one before the helper does.
   std::shared_ptr<DispatchQueue> createQueue() {
-    return service_.createSerialQueue("q", QualityOfService::kUtility, QueueThreading::kOwnThread);
+    auto queue =
+        service_.createSerialQueue("q", QualityOfService::kUtility, QueueThreading::kOwnThread);
+    EXPECT_TRUE(letOwnThreadSleep(*queue));
+    return queue;
   }
   static bool drain(DispatchQueue& queue) {
     std::promise<void> done;
@@ -214,7 +219,6 @@ TEST_F(HelpingTest, EndlessWorkIsLeftToTheOwnThread) {
     queue->async(JobWeight::kBrief, again);
   };
 
-  ASSERT_TRUE(letOwnThreadSleep(*queue));
   service_.beginHelping();
   queue->async(JobWeight::kBrief, again);
   service_.endHelping();
