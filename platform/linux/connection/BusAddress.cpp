@@ -73,10 +73,12 @@ std::string busAddressOf(BusKind bus) {
         return address;
       }
       const std::string runtime = environment("XDG_RUNTIME_DIR");
+      // Where systemd's user manager puts the bus of a login, with or without the variable.
       return runtime.empty() ? "" : "unix:path=" + runtime + "/bus";
     }
     case BusKind::kSystem: {
       const std::string address = environment("DBUS_SYSTEM_BUS_ADDRESS");
+      // The path of the system bus that D-Bus defines.
       return address.empty() ? "unix:path=/run/dbus/system_bus_socket" : address;
     }
   }

@@ -47,6 +47,7 @@ BusConnection::~BusConnection() { abandon(); }
 
 void BusConnection::start() {
   stream_.setReading(true);
+  // Messages that the connector has read already do not make the socket readable again.
   handleFrames();
   stream_.input().settle();
 }
@@ -87,6 +88,7 @@ void BusConnection::handleFrames() {
     next.state == FrameBuffer::State::kOversized ? handleOversized(next) : handleFrame(next);
     stream_.input().consume(next.totalBytes);
   }
+  // After all frames of the read were sorted, so that each sender has its share of the turn.
   for (const std::shared_ptr<BusSender>& sender : std::exchange(touched_, {})) {
     sender->deliverReceived();
   }
@@ -105,6 +107,7 @@ void BusConnection::handleFrame(const FrameBuffer::Next& next) {
     case dbus::MessageType::kMethodCall: {
       std::shared_ptr<BusSender> sender = senderNamed(frame.header.sender);
       sender->receive(frame.header, next.bytes);
+      // A sender may be in the list twice. The second delivery finds nothing.
       if (touched_.empty() || touched_.back() != sender) touched_.push_back(std::move(sender));
       break;
     }
@@ -129,6 +132,7 @@ void BusConnection::handleOversized(const FrameBuffer::Next& next) {
 void BusConnection::handleSignal(const dbus::Frame& frame) {
   const dbus::MessageHeader& header = frame.header;
   const bool isFromBus = header.sender == bus_names::kBus && header.interface == bus_names::kBus;
+  // Any sender can send such a signal to our name. Only the bus knows who has left.
   if (!isFromBus || header.member != "NameOwnerChanged") return;
   std::vector<Value> names;  // the name, its old owner, its new one
   if (dbus::decodeBody(frame, "sss", names).has_value() || !names[2].string().empty()) return;
@@ -158,6 +162,7 @@ std::shared_ptr<BusSender> BusConnection::senderNamed(std::string_view name) {
                                 .member = "GetConnectionCredentials"};
   const std::uint32_t serial = stream_.nextSerial();
   if (dbus::appendMethodCall(stream_.output().bytes(), serial, target, "s", arguments)) {
+    // A weak pointer: the sender may leave before the bus answers.
     questions_.emplace(serial, sender);
     stream_.outputAdded();
   }
@@ -169,6 +174,7 @@ void BusConnection::lose(const std::string& why) {
   kLog.error("lost the bus: ", why, "; disconnecting its ", senders_.size(),
              " clients and serving the socket only");
   stream_.setReading(false);
+  // A copy, because a sender that ends removes itself from the map.
   const auto senders = senders_;
   for (const auto& [name, sender] : senders) sender->onBusLost();
   questions_.clear();

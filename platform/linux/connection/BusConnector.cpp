@@ -59,9 +59,11 @@ std::variant<BusSession, ConnectionOpenError> BusConnector::connect(const std::s
   const auto ignore = [](const Value&) -> Failure { return std::nullopt; };
   if (Failure failure = call("Hello", "", {}, "s", ignore)) return *std::move(failure);
   const std::array rule = {Value(kVanishingNames)};
+  // Before the name: once it is ours, a sender can call and leave, and its end must not be missed.
   if (Failure failure = call("AddMatch", "s", rule, "", ignore)) return *std::move(failure);
   if (Failure failure = requestName()) return *std::move(failure);
   const std::span<const std::byte> rest = input_.unused();
+  // Requests may have come right after the name was ours.
   kept_.insert(kept_.end(), rest.begin(), rest.end());
   return BusSession{.fd = std::move(fd_), .unused = std::move(kept_), .lastSerial = lastSerial_};
 }
@@ -157,6 +159,7 @@ std::variant<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::
       input_.settle();
       continue;
     }
+    // A copy, because the frame of the result points into it and consuming changes the buffer.
     answer_.assign(next.bytes.begin(), next.bytes.end());
     input_.consume(next.totalBytes);
     std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(answer_);
@@ -165,6 +168,7 @@ std::variant<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::
     }
     const dbus::Frame& frame = std::get<dbus::Frame>(read);
     if (frame.header.replySerial == serial) return frame;
+    // Not an answer but a signal or an early request. The connection handles it later.
     kept_.insert(kept_.end(), answer_.begin(), answer_.end());
   }
 }

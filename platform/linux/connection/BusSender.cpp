@@ -30,6 +30,7 @@ std::string BusSender::description() const {
 
 void BusSender::receive(const dbus::MessageHeader& header, std::span<const std::byte> frame) {
   const std::size_t waiting = input_.unused().size();
+  // One request always fits, up to the limit of frames: the bound is for those that pile up.
   if (waiting == 0 || waiting + frame.size() <= kMaxWaitingBytesOfSender) {
     input_.append(frame);
     return;
@@ -43,6 +44,7 @@ void BusSender::receive(const dbus::MessageHeader& header, std::span<const std::
 void BusSender::receiveOversized(const FrameBuffer::Next& next) { refuseOversized(next); }
 
 void BusSender::deliverReceived() {
+  // Not while flow control holds the sender back; it becomes due when there is room.
   if (wantsInput()) deliver();
 }
 
@@ -56,6 +58,7 @@ void BusSender::onCredentials(const PeerCredentials& credentials) {
 }
 
 void BusSender::onVanished() {
+  // Its requests are still delivered: it may have sent a message and left on purpose.
   vanished_ = true;
   deliverReceived();
 }

@@ -45,10 +45,13 @@ void ClientConnection::resume() {
   if (state_ != State::kNotResumed) return;
   state_ = State::kReading;
   setReading(true);
+  // Requests that came together with the end of the handshake are already read. The socket will not
+  // become readable because of them.
   if (!input().unused().empty()) becomeDue();
 }
 
 void ClientConnection::deliver() {
+  // The delegate has not said yet whether it wants this client.
   if (state_ == State::kNotResumed) setReading(false);
   if (state_ == State::kNotResumed || state_ == State::kEnded) return input().settle();
   state_ = State::kReading;
@@ -63,7 +66,12 @@ void ClientConnection::deliver() {
       onDelivered(next.state == FrameBuffer::State::kPartial, bytes > 0);
       break;
     }
+    // Only with a frame at hand: a client that asks for nothing more need not be held back. Before
+    // the share, because a client that is due would be looked at in every turn although it must
+    // wait.
     if (mustWait()) break;
+    // Looks at what was delivered before this frame, so that a frame larger than a whole share is
+    // delivered too.
     if (requestsLeft == 0 || bytes >= kTurnBytes) {
       pressed ? waitInState(State::kWaitingForRelief) : becomeDue();
       break;
@@ -73,6 +81,7 @@ void ClientConnection::deliver() {
     bytes += next.totalBytes;
     --requestsLeft;
   }
+  // In every turn: the next client reads into the same scratch.
   input().settle();
 }
 
@@ -90,6 +99,7 @@ ClientConnection::Step ClientConnection::deliverFrame(const FrameBuffer::Next& n
     onMalformed(error->message + " at byte " + std::to_string(error->offset));
     return Step::kStop;
   }
+  // The delivery queues jobs. Only a batch lets this thread run them, and wakes the pool once.
   host_.turn().beforeDelivery();
   host_.dispatcher().dispatch(*this, std::get<dbus::Frame>(read), next.totalBytes);
   return hasEnded() ? Step::kStop : Step::kGoOn;
@@ -104,6 +114,7 @@ void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
     return onMalformed(error->message + " at byte " + std::to_string(error->offset));
   }
   const dbus::MessageHeader& request = std::get<dbus::Frame>(read).header;
+  // Nobody waits for an answer to anything else.
   if (request.type != dbus::MessageType::kMethodCall) return;
   host_.statistics().requestsReceived.add();
   refuse(request, Refusal::kTooLarge, error_names::kLimitsExceeded,
@@ -112,6 +123,7 @@ void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
 }
 
 bool ClientConnection::mustWait() {
+  // wait() is false if requests have been carried out in between: nobody would wake this client.
   if (link_->flow().isFull() && link_->flow().wait()) {
     waitInState(State::kWaitingForRoom);
     return true;
@@ -146,6 +158,7 @@ void ClientConnection::onRelief() {
 void ClientConnection::onOutputRoom() {
   if (state_ != State::kWaitingForReader) return;
   const OutputQueue& output = stream().output();
+  // The gap to the bound keeps a slow reader from stopping and starting with each reply.
   if (output.unsentFrames() > kMaxUnreadReplies / 2) return;
   if (output.unsentBytes() > kMaxUnreadReplyBytes / 2) return;
   becomeDue();
@@ -155,11 +168,14 @@ void ClientConnection::end(Why why) {
   if (state_ == State::kEnded) return;
   state_ = State::kEnded;
   why_ = why;
+  // The handlers are called in the next turn: end() may be called from within a delivery, whose
+  // replies still have to leave.
   onEnded();
   host_.turn().finishNext(shared_from_this());
 }
 
 void ClientConnection::finish() {
+  // The port promises this order, and an interruption only if the other side ended the connection.
   if (why_ == Why::kPeerVanished && interruptionHandler_) interruptionHandler_();
   if (invalidationHandler_) invalidationHandler_();
   if (unloggedRefusals_ > 0) {
@@ -179,6 +195,7 @@ void ClientConnection::abandon() {
 }
 
 void ClientConnection::letGo() {
+  // First: what is released below can answer requests, and those replies must not come back here.
   link_->detach();
   interruptionHandler_ = nullptr;
   invalidationHandler_ = nullptr;

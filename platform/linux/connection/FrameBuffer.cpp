@@ -25,6 +25,7 @@ std::size_t headerBytes(std::span<const std::byte> frame) {
 }  // namespace
 
 std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
+  // What is unused is always the end of own_. Everything before it was used up.
   if (const std::size_t wanted = bytesThatDoNotFitScratch(); wanted > 0) {
     // Doubles what has arrived instead of trusting the size that the header claims.
     const std::size_t offset = own_.size() - view_.size();
@@ -37,6 +38,7 @@ std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
     return readSpan_;
   }
   const std::span<std::byte> bytes = scratch.bytes();
+  // A frame that was cut by the last read must be contiguous with its rest to be decoded in place.
   if (!view_.empty()) std::memcpy(bytes.data(), view_.data(), view_.size());
   view_ = bytes.first(view_.size());
   inScratch_ = true;
@@ -45,6 +47,7 @@ std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
 }
 
 void FrameBuffer::received(std::size_t count) {
+  // Gives back what readInto() added for bytes that did not come. Does not move what is there.
   if (!inScratch_) own_.resize(view_.size() + count);
   const std::byte* start = inScratch_ ? readSpan_.data() - view_.size() : own_.data();
   view_ = {start, view_.size() + count};
@@ -60,12 +63,14 @@ void FrameBuffer::settle() {
     view_ = own_;
   }
   if (!view_.empty()) return;
+  // clear() would keep the memory, and most connections are idle most of the time.
   own_ = std::vector<std::byte>();
   view_ = {};
 }
 
 void FrameBuffer::append(std::span<const std::byte> bytes) {
   const std::size_t usedUp = own_.size() - view_.size();
+  // Erasing moves the rest. From one half on, each byte is moved at most once on average.
   if (usedUp > own_.size() / 2) {
     own_.erase(own_.begin(), own_.begin() + static_cast<std::ptrdiff_t>(usedUp));
   }
@@ -80,6 +85,8 @@ FrameBuffer::Next FrameBuffer::next() const {
     next.state = skip_ > 0 ? State::kPartial : State::kEmpty;
     return next;
   }
+  // With the limit of D-Bus and not ours: a frame between the two is answered with an error and
+  // skipped, and the connection goes on.
   dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);
   next.state = State::kPartial;
   if (measure.state == dbus::FrameMeasure::State::kNeedMoreBytes) return next;
@@ -111,6 +118,7 @@ FrameBuffer::Next FrameBuffer::next() const {
 
 void FrameBuffer::consume(std::size_t count) {
   const std::size_t present = std::min(count, view_.size());
+  // Of a frame over the limit, most bytes are still on their way.
   skip_ += count - present;
   view_ = view_.subspan(present);
 }

@@ -33,10 +33,13 @@ void Inbox::post(const Add& add) {
     const MutexLock lock(mutex_);
     if (closed_) return;
     add();
+    // Only the first post after the loop fell asleep pays for a system call.
     mustWake = std::exchange(sleeping_, false);
   }
   if (!mustWake) return;
   const std::uint64_t one = 1;
+  // After the lock is released: the loop wakes at once and takes it. The write cannot fail: it
+  // happens once for each sleep, so the counter never fills up.
   static_cast<void>(write(event_.get(), &one, sizeof one));
 }
 
@@ -63,6 +66,7 @@ bool Inbox::isLoopThread() const {
 void Inbox::attachToThisThread() { loopThread_ = std::this_thread::get_id(); }
 
 void Inbox::close() {
+  // From now on this thread posts like any other, and finds the inbox closed.
   loopThread_ = std::thread::id();
   Mail dropped;  // destroyed after the lock is released: what it holds may post again
   const MutexLock lock(mutex_);
@@ -72,6 +76,8 @@ void Inbox::close() {
 
 bool Inbox::trySleep() {
   const MutexLock lock(mutex_);
+  // In one critical section with the flag: a post is either seen here or sees that it must wake the
+  // loop.
   if (!mail_.isEmpty()) return false;
   sleeping_ = true;
   return true;
@@ -89,6 +95,7 @@ void Inbox::take(Mail& into) {
 
 void Inbox::onReady(std::uint32_t /*events*/) {
   std::uint64_t posts = 0;
+  // Only resets the eventfd, which is level-triggered. The mail is read at the end of the turn.
   static_cast<void>(read(event_.get(), &posts, sizeof posts));
 }
 

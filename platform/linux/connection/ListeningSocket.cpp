@@ -49,6 +49,7 @@ bool ListeningSocket::acceptOne() {
   UniqueFd fd(accept4(fd_.get(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
   if (fd) {
     isShort_ = false;
+    // Without credentials nothing is known about the client, so it is disconnected.
     if (const std::optional<PeerCredentials> credentials = credentialsOf(fd.get())) {
       host_.acceptPeer(std::move(fd), *credentials);
     }
@@ -63,9 +64,11 @@ bool ListeningSocket::acceptOne() {
 }
 
 void ListeningSocket::waitForDescriptors(int error) {
+  // The backlog stays readable, so a level-triggered loop would spin.
   host_.loop().forget(fd_.get());
   isWaiting_ = true;
   host_.acceptRetries().start(retry_);
+  // One line for each shortage, and not one a second.
   if (std::exchange(isShort_, true)) return;
   host_.statistics().acceptPauses.add();
   kLog.error("cannot accept connections (", errnoText(error),

@@ -26,6 +26,7 @@ std::unique_ptr<OutputBuffer> OutputBufferPool::take() {
 }
 
 void OutputBufferPool::give(std::unique_ptr<OutputBuffer> buffer) {
+  // One large answer must not stay in memory for the life of the service.
   if (spare_.size() >= kSpareBuffers || buffer->bytes.capacity() > kMaxSpareBytes) return;
   buffer->bytes.clear();
   buffer->frameEnds.clear();
@@ -54,9 +55,11 @@ OutputQueue::Flush OutputQueue::flush(int fd, std::size_t& sentBytes, std::size_
     clear();
     return Flush::kEmpty;
   }
+  // Without MSG_NOSIGNAL, a client that leaves would end the service by SIGPIPE.
   const ssize_t count = send(fd, buffer_->bytes.data() + buffer_->sentBytes, unsentBytes(),
                              MSG_NOSIGNAL | MSG_DONTWAIT);
   if (count < 0) {
+    // After EINTR too, the loop tries again as soon as the socket has room.
     if (errno == EAGAIN || errno == EINTR || errno == ENOBUFS) return Flush::kBlocked;
     droppedFrames += clear();
     return Flush::kPeerGone;

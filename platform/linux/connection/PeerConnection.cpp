@@ -30,7 +30,9 @@ std::string PeerConnection::description() const {
 }
 
 void PeerConnection::setReading(bool reading) {
+  // A client that is held back cannot finish its message, so this is not its fault.
   if (!reading) deadline_.stop();
+  // The handshake goes on while the delegate has not accepted the client yet.
   stream_.setReading(reading || handshake_ != nullptr);
 }
 
@@ -38,6 +40,8 @@ void PeerConnection::onReadable() {
   // Messages that were read and wait for the next turn must be delivered before more is read.
   if (handshake_ == nullptr && !wantsInput()) return;
   if (stream_.read() == SocketStream::Read::kEnded) {
+    // A client may send its last requests and close at once. They are delivered before the
+    // connection ends.
     peerClosed_ = true;
     stream_.setReading(false);
   }
@@ -79,6 +83,7 @@ void PeerConnection::onDelivered(bool begun, bool progress) {
   }
   stream_.setReading(true);
   if (handshake_ != nullptr) return;
+  // A whole message restarts the time. A client that sends single bytes of one gains nothing.
   if (progress || !begun) deadline_.stop();
   if (begun) host().messages().start(deadline_);
 }

@@ -31,6 +31,7 @@ const InterfaceMethod* findMethod(const NSXPCInterface& interface, std::string_v
 }
 
 std::size_t weightOf(const InterfaceMethod& method) {
+  // A dictionary describes one session. Only a list grows with the number of sessions.
   const bool answersList = method.out.starts_with('a') && !method.out.starts_with("a{");
   return answersList ? kListRequestWeight : 1;
 }
@@ -38,6 +39,7 @@ std::size_t weightOf(const InterfaceMethod& method) {
 ReplyCallback makeReply(const ClientConnection& client, const dbus::MessageHeader& header,
                         const InterfaceMethod& method) {
   if ((header.flags & dbus::kNoReplyExpected) != 0) {
+    // The object always calls its reply, also where D-Bus forbids to send one.
     return [](const std::optional<Error>&, const Value&) {};
   }
   return [ticket = std::make_shared<ReplyTicket>(client.link(), header.serial, method.out)](
@@ -70,6 +72,8 @@ RequestDispatcher::RequestDispatcher(const ConnectionOptions& options,
 void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& frame,
                                  std::size_t frameBytes) {
   const dbus::MessageHeader& header = frame.header;
+  // The service asks clients nothing, so returns and errors answer nothing. D-Bus lets us ignore
+  // them.
   if (header.type != dbus::MessageType::kMethodCall) {
     statistics_.messagesIgnored.add();
     return;
@@ -78,6 +82,8 @@ void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& fr
   const Request request{.client = client, .frame = frame, .frameBytes = frameBytes};
   if (request.isForExportedObject()) {
     const NSXPCInterface& exported = *client.exportedInterface();
+    // D-Bus allows calls without an interface if the name of the method is unambiguous. The
+    // exported interface has precedence over the standard ones.
     if (header.interface.empty() || header.interface == exported.name) {
       const InterfaceMethod* method = findMethod(exported, header.member);
       if (method != nullptr) return deliver(request, *method);
@@ -90,9 +96,11 @@ void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& fr
 }
 
 void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& method) {
+  // Rights and limits before the body: a refused request costs no decoding.
   if (method.access == MethodAccess::kOwner && isForbidden(request, method)) return;
   if (method.effect != MethodEffect::kHoldsNoMore && isOverLimits(request, method)) return;
   if (!decode(request, method.in)) return;
+  // The only limit that needs the arguments.
   if (namesTooManyReporters(request, method)) {
     arguments_.clear();
     return;
@@ -106,6 +114,7 @@ void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& m
                  .reply = makeReply(client, request.header(), method),
                  .context = {.sender = client.processIdentifier(),
                              .token = std::make_shared<OpenRequest>(client.link(), cost)}});
+  // The values of one request must not live until the next.
   arguments_.clear();
 }
 
@@ -113,6 +122,7 @@ bool RequestDispatcher::isForbidden(const Request& request, const InterfaceMetho
   constexpr uid_t kRoot = 0;
   const uid_t owner = geteuid();
   const uid_t user = request.client.credentials().uid;
+  // The user comes from the kernel or from the bus, never from the message. A bus may not know it.
   if (user != kUnknownUser && (user == owner || user == kRoot)) return false;
   const std::string who = user == kUnknownUser ? "an unknown user" : "uid " + std::to_string(user);
   request.client.refuse(request.header(), Refusal::kNotAllowed, error_names::kAccessDenied,
@@ -179,6 +189,8 @@ void RequestDispatcher::answerStandard(const Request& request, const StandardMet
 // False when the request was refused or the client disconnected.
 bool RequestDispatcher::decode(const Request& request, std::string_view signature) {
   const dbus::MessageHeader& header = request.header();
+  // The socket is read without ancillary data, so the kernel has closed the descriptors. The
+  // message cannot mean without them what its sender meant.
   if (header.unixFds != 0) {
     request.client.refuse(header, Refusal::kUnsupportedValue, error_names::kInvalidArgs,
                           quoted(header.member) + ": the message has " +

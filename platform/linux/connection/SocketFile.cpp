@@ -50,6 +50,7 @@ std::optional<ConnectionOpenError> clearTheWay(const std::filesystem::path& path
   if (!probe) return failure(Kind::kSystem, path, errnoText(errno));
   const int result =
       connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
+  // EAGAIN: the backlog is full, so somebody listens.
   if (result == 0 || errno == EAGAIN || errno == EINPROGRESS) {
     return failure(Kind::kAlreadyServed, path,
                    "another process answers on it; stop it or set listener.socket");
@@ -58,6 +59,7 @@ std::optional<ConnectionOpenError> clearTheWay(const std::filesystem::path& path
     return failure(Kind::kSystem, path,
                    "cannot find out whether another process serves it: " + errnoText(errno));
   }
+  // Nobody listens: the service that made it was killed before it could remove it.
   static_cast<void>(unlink(path.c_str()));
   return std::nullopt;
 }
@@ -81,6 +83,7 @@ ConnectionOpenError bindFailure(const std::filesystem::path& path, int error) {
 
 // The ID of the group; none if there is no group of that name; or an errno value.
 std::variant<std::optional<gid_t>, int> findGroup(const std::string& name) {
+  // A group with many members needs a large buffer. 16 MiB end a look-up that always wants more.
   constexpr std::size_t kLargestEntry = std::size_t{1} << 24U;
   group entry{};
   group* found = nullptr;
@@ -111,6 +114,7 @@ std::optional<ConnectionOpenError> giveToGroup(const std::filesystem::path& path
         .description = "listener.group: expected a group of this system, found " + quoted};
   }
   constexpr uid_t kSameUser = static_cast<uid_t>(-1);
+  // The path and not the descriptor: fchown() of a socket does not change its file.
   if (fchownat(AT_FDCWD, path.c_str(), kSameUser, *id, AT_SYMLINK_NOFOLLOW) == 0) {
     return std::nullopt;
   }
@@ -164,6 +168,7 @@ SocketFile& SocketFile::operator=(SocketFile&& other) noexcept {
 
 void SocketFile::remove() noexcept {
   struct stat status {};
+  // Another service may have put its own socket in this place since.
   if (!path_.empty() && lstat(path_.c_str(), &status) == 0 && status.st_dev == device_ &&
       status.st_ino == inode_) {
     static_cast<void>(unlink(path_.c_str()));
@@ -190,6 +195,7 @@ std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::p
     return failure(Kind::kSystem, path, "cannot set its permissions: " + errnoText(errno));
   }
   if (bind(bound.fd.get(), generic, sizeof *address) != 0) return bindFailure(path, errno);
+  // From here on, each failure removes the file again.
   bound.file = SocketFile(path);
   if (auto error = letIn(path, access)) return *std::move(error);
   if (listen(bound.fd.get(), SOMAXCONN) != 0) {
@@ -201,12 +207,15 @@ std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::p
 void makeDirectoryOf(const std::filesystem::path& path, const SocketAccess& access) {
   constexpr std::uint32_t kOthers = 0077;
   const std::string directory = path.parent_path().native();
+  // One that exists keeps its permissions: its owner chose them. Other failures show in bind().
   if (mkdir(directory.c_str(), 0700) != 0) return;
   if ((access.mode & kOthers) != 0) static_cast<void>(chmod(directory.c_str(), 0755));
 }
 
 std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
   std::vector<UniqueFd> sockets;
+  // 1: removes the variables, so that programs which the service starts do not take the sockets for
+  // theirs.
   const int count = sd_listen_fds(1);
   for (int fd = SD_LISTEN_FDS_START; fd < SD_LISTEN_FDS_START + count; ++fd) {
     sockets.emplace_back(fd);
@@ -216,6 +225,7 @@ std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
                                  .description = "the passed descriptor " + std::to_string(fd) +
                                                 " is not a listening Unix stream socket"};
     }
+    // systemd passes blocking sockets by default. accept() would hang at an empty backlog.
     static_cast<void>(fcntl(fd, F_SETFL, O_NONBLOCK));
   }
   if (count < 0) {

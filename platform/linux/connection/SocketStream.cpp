@@ -19,6 +19,7 @@ SocketStream::SocketStream(UniqueFd fd, ConnectionHost& host, StreamOwner& owner
       output_(host.outputBuffers()) {}
 
 std::uint32_t SocketStream::nextSerial() {
+  // D-Bus forbids the serial 0. The counter wraps after four thousand million frames.
   if (++lastSerial_ == 0) ++lastSerial_;
   return lastSerial_;
 }
@@ -26,7 +27,9 @@ std::uint32_t SocketStream::nextSerial() {
 SocketStream::Read SocketStream::read() {
   const std::span<std::byte> room = input_.readInto(host_.scratch());
   const ssize_t count = ::read(fd_.get(), room.data(), room.size());
+  // Kept before received(), which may allocate and change it.
   const int error = errno;
+  // Also when nothing came: readInto() may have moved what was left over.
   input_.received(count > 0 ? static_cast<std::size_t>(count) : 0);
   if (count > 0) {
     host_.statistics().bytesReceived.add(static_cast<std::uint64_t>(count));
@@ -60,6 +63,7 @@ void SocketStream::flush() {
   if (dropped > 0) host_.statistics().repliesDroppedGone.add(dropped);
   const bool wasBlocked = std::exchange(blocked_, result == OutputQueue::Flush::kBlocked);
   if (wasBlocked != blocked_) updateInterest();
+  // Also after a failure: output that was dropped makes room too.
   owner_.onOutputProgress();
 }
 
@@ -77,6 +81,7 @@ bool SocketStream::close() {
 
 void SocketStream::onReady(std::uint32_t events) {
   if (!fd_) return;
+  // EPOLLHUP and EPOLLERR count as room: the write then fails and drops the output.
   if (blocked_ && (events & ~std::uint32_t{EPOLLIN}) != 0 && !flushing_) {
     flushing_ = true;
     host_.turn().flushLater(*this);

@@ -15,6 +15,7 @@ struct FieldRule {
   std::string_view name;
   char type;
 };
+// The fields that D-Bus defines. The index is the number of the field; 0 is invalid.
 constexpr std::array<FieldRule, 10> kFieldRules{{{"", '\0'},
                                                  {"path", 'o'},
                                                  {"interface", 's'},
@@ -97,17 +98,21 @@ class FieldReader {
       return false;
     }
     if (code_ == 0) return reader_.fail("a field cannot have the number 0");
+    // D-Bus may define more fields. It requires that readers ignore those that they do not know.
     if (code_ >= kFieldRules.size()) return skipUnknown(type);
     if (type.size() != 1 || type.front() != kFieldRules[code_].type) {
       return reader_.fail("its type is not the one that D-Bus defines");
     }
     const unsigned bit = 1U << code_;
+    // Of two paths, a bus could check its policy by the first while this would act on the last.
     if ((seen_ & bit) != 0) return reader_.fail("occurs twice");
     seen_ |= bit;
     return readKnown(static_cast<HeaderField>(code_));
   }
 
   bool skipUnknown(std::string_view type) {
+    // A field with an unsupported type is skipped like any other. One with an invalid type has no
+    // known length, so the next field could not be found.
     const SignatureShape shape = shapeOfType(type);
     if (shape == SignatureShape::kBroken || shape == SignatureShape::kTooDeep) {
       return reader_.fail("its signature is invalid");
@@ -169,6 +174,7 @@ class FieldReader {
         return fieldBit(HeaderField::kPath) | fieldBit(HeaderField::kInterface) |
                fieldBit(HeaderField::kMember);
     }
+    // The dispatcher ignores such messages, so it does not matter which fields they have.
     return 0;  // an unknown type
   }
 
@@ -199,16 +205,20 @@ std::variant<Frame, WireError> finish(MessageHeader header, std::span<const std:
 FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrameBytes) {
   std::size_t offset = 0;
   const std::string_view problem = problemOfStart(bytes, offset);
+  // Looks at each of the first bytes as soon as it is there: a broken stream ends now and not after
+  // the time limit of a message.
   if (!problem.empty()) return broken(std::string(problem), offset);
   if (bytes.size() < kFrameStartBytes) return {};
 
   const bool bigEndian = byteAt(bytes, 0) == 'B';
+  // In 64 bits, because the sum of two lengths of 32 bits must not wrap to a small frame.
   const std::uint64_t bodyBytes = numberAt(bytes, kBodyLengthOffset, bigEndian);
   const std::uint64_t fieldsBytes = numberAt(bytes, kFieldsLengthOffset, bigEndian);
   if (fieldsBytes > kMaxArrayBytes) {
     return broken("the header claims more than 64 MiB of fields", kFieldsLengthOffset);
   }
   const std::uint64_t total = roundedUp(kFrameStartBytes + fieldsBytes) + bodyBytes;
+  // Two limits with two texts: D-Bus allows no message over the first. The second is the caller's.
   if (total > kMaxMessageBytes) {
     return broken("the header claims a message of " + std::to_string(total) +
                       " bytes, the limit of D-Bus is " + std::to_string(kMaxMessageBytes),

@@ -20,6 +20,7 @@ class FrameBuilder {
                                     kProtocolVersion};
     out_.append(first.data(), first.size());
     encoder_.appendNumber(std::uint32_t{0});
+    // The two lengths around the serial are known only at the end. finish() replaces them.
     encoder_.appendNumber(serial);
     encoder_.appendNumber(std::uint32_t{0});
   }
@@ -45,15 +46,18 @@ class FrameBuilder {
 
   // Adds the last field, ends the header and appends the body.
   bool finish(std::string_view signature, std::span<const Value> values) {
+    // Without this field, D-Bus assumes an empty body.
     if (!signature.empty()) {
       beginField(HeaderField::kSignature, "g");
       encoder_.appendSignature(signature);
     }
+    // Before the padding: it belongs to neither length.
     encoder_.replaceLength(start_ + kFieldsLengthOffset, out_.size() - start_ - kFrameStartBytes);
     encoder_.align(8);
     const std::size_t bodyStart = out_.size();
     if (!encoder_.appendAll(signature, values)) return false;
     encoder_.replaceLength(start_ + kBodyLengthOffset, out_.size() - bodyStart);
+    // A length that did not fit into 32 bits has been cut just now. This removes that frame.
     finished_ = out_.size() - start_ <= kMaxMessageBytes;
     return finished_;
   }

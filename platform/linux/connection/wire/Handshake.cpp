@@ -67,6 +67,8 @@ bool HandshakeLine::take(std::span<const std::byte>& input) {
   if (complete_) line_.clear();
   complete_ = false;
   std::size_t taken = 0;
+  // Takes nothing after the end of the line: what follows BEGIN is the first message, often in the
+  // same read.
   while (!complete_ && taken < input.size() && !isTooLong()) {
     line_ += std::to_integer<char>(input[taken++]);
     complete_ = !isTooLong() && line_.ends_with(kLineEnd);
@@ -89,6 +91,8 @@ ServerHandshake::ServerHandshake(std::string guidHex, uid_t peerUid)
 HandshakeProgress ServerHandshake::feed(std::span<const std::byte> input, std::string& output) {
   std::span<const std::byte> rest = input;
   if (step_ == Step::kNul && !rest.empty()) {
+    // D-Bus demands it. On some systems this byte carried the credentials; here the kernel has
+    // them.
     if (rest.front() != std::byte{0}) fail("the first byte is not NUL");
     if (step_ == Step::kNul) step_ = Step::kAuth;
     rest = rest.subspan(1);
@@ -109,11 +113,13 @@ bool ServerHandshake::isOver() const { return step_ == Step::kDone || step_ == S
 void ServerHandshake::onLine(std::string_view line, std::string& output) {
   const auto [command, arguments] = split(line);
   if (!isPrintableAscii(line)) {
+    // Never echoes the line: it may contain anything.
     refuse("not printable ASCII", output);
   } else if (command == "BEGIN") {
     if (step_ == Step::kBegin) {
       step_ = Step::kDone;
     } else {
+      // Not an ERROR: the client may already send messages, and D-Bus requires to disconnect it.
       fail("BEGIN before the authentication");
     }
   } else if (command == "AUTH" && step_ == Step::kAuth) {
@@ -123,6 +129,7 @@ void ServerHandshake::onLine(std::string_view line, std::string& output) {
   } else if (command == "CANCEL" || command == "ERROR") {
     onCancel(command, output);
   } else if (command == "NEGOTIATE_UNIX_FD" && step_ == Step::kBegin) {
+    // Clients go on without descriptors after this. The service takes none, so it cannot leak any.
     output += "ERROR file descriptors are not taken\r\n";
     countRefusal();
   } else {
@@ -134,6 +141,8 @@ void ServerHandshake::onAuth(std::string_view arguments, std::string& output) {
   const auto [mechanism, response] = split(arguments);
   if (mechanism == "ANONYMOUS") {
     if (isHex(response)) {
+      // The kernel has said who the client is. Nothing in the handshake can change that, so
+      // anonymous clients need not be refused.
       accept(output);  // the trace that the client sends is not used
     } else {
       reject(output);
@@ -141,6 +150,7 @@ void ServerHandshake::onAuth(std::string_view arguments, std::string& output) {
   } else if (mechanism != "EXTERNAL") {
     reject(output);
   } else if (response.empty()) {
+    // The identity may follow in a line of its own; sd-bus sends it so.
     step_ = Step::kData;
     output += "DATA\r\n";
   } else {
@@ -149,6 +159,7 @@ void ServerHandshake::onAuth(std::string_view arguments, std::string& output) {
 }
 
 void ServerHandshake::onIdentity(std::string_view hex, std::string& output) {
+  // An empty identity means the one that the kernel has. Any other must be equal to that.
   if (hex.empty() || (isHex(hex) && fromHex(hex) == peerUid_)) {
     accept(output);
   } else {

@@ -50,11 +50,13 @@ constexpr std::uint8_t kWord = kLetter | kDigit;
 constexpr ElementRules kPathRules{'/', kWord, kWord};
 constexpr ElementRules kInterfaceRules{'.', kLetter, kWord};
 constexpr ElementRules kWellKnownRules{'.', kLetter | kHyphen, kWord | kHyphen};
+// In names that a bus gives, elements may start with a digit, as in `:1.42`.
 constexpr ElementRules kUniqueRules{'.', kWord | kHyphen, kWord | kHyphen};
 
 }  // namespace
 
 bool isObjectPath(std::string_view text) {
+  // D-Bus does not limit the length of paths, so neither does this.
   if (text.empty() || text.front() != '/') return false;
   return text.size() == 1 || countElements(text.substr(1), kPathRules) > 0;
 }

@@ -35,6 +35,7 @@ class TypeScanner {
   bool scanType(unsigned arrays, unsigned structs) {
     const char code = next();
     const Role role = roleOf(code);
+    // Continues: a rest that is invalid makes the message malformed, which ends the connection.
     if (arrays > kMaxSignatureNesting || structs > kMaxSignatureNesting) tooDeep_ = true;
     if (code == 'a') {
       return peek() == '{' ? scanEntry(arrays + 1, structs + 1) : scanType(arrays + 1, structs);
@@ -67,6 +68,7 @@ class TypeScanner {
   // A date is the only supported struct.
   bool scanStruct(unsigned arrays, unsigned structs) {
     if (text_.substr(position_, 2) != "d)") unsupported_ = true;
+    // At least one member: D-Bus has no empty structs.
     do {
       if (!scanType(arrays, structs)) return false;
     } while (!atEnd() && peek() != ')');

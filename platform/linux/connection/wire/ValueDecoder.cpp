@@ -11,8 +11,9 @@ namespace {
 
 using Kind = DecodeError::Kind;
 
-// More elements than ordinary messages have in all containers that are open at a time. A scratch
-// that grew beyond gives the memory back.
+// More elements than ordinary messages have in all containers that are open at a time. With a
+// smaller bound, such messages would allocate the scratch again each time. Without one, the largest
+// message would hold its memory for the life of the service.
 constexpr std::size_t kKeptElements = 1024;
 
 // Decodes the values of one body. `type` is always one valid, complete type: the signatures of
@@ -80,6 +81,8 @@ bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& argume
     }
     rest.remove_prefix(type.size());
   }
+  // The header gives the length of the body and the signature of its content. If the two disagree,
+  // nothing that was decoded can be trusted.
   if (!reader_.atLimit()) {
     refuse(Kind::kMalformed, "there are bytes after the last argument", types);
   }
@@ -112,6 +115,7 @@ Value Decoder::decode(std::string_view type, unsigned level) {
       return decodeText(type, &WireReader::readPath);
     case 'g':
       return decodeText(type, &WireReader::readSignature);
+    // D-Bus counts the levels of containers only. A number stays on the level of what contains it.
     default:
       return decodeContainer(type, level + 1);
   }
@@ -123,8 +127,10 @@ Value Decoder::decodeContainer(std::string_view type, unsigned level) {
                   "containers nested more than 64 levels deep are not supported", type);
   }
   if (type.front() == 'v') return decodeVariant(level);
+  // Before the array: D-Bus has no other type for data, and bytes are copied as a block.
   if (type == "ay") return decodeData();
   if (type.starts_with("a{s")) return decodeDictionary(type, level);
+  // Dictionaries with other keys are valid on the wire, but ours have texts as keys.
   if (type.front() == 'a' && type[1] != '{') return decodeArray(type, level);
   if (type == "(d)") return decodeDate(type);
   return refuse(Kind::kUnsupported, "values of this type are not supported", type);
@@ -137,12 +143,15 @@ Value Decoder::decodeBoolean(std::string_view type) {
 
 Value Decoder::decodeDate(std::string_view type) {
   Date date;
+  // A struct begins on a multiple of 8 bytes, whatever its first member is.
   return reader_.align(8) && reader_.read(date.secondsSince1970) ? Value(date) : malformed(type);
 }
 
 Value Decoder::decodeVariant(unsigned level) {
   std::string_view type;
   if (!reader_.readVariantSignature(type)) return malformed("v");
+  // The check of the frame's signature has seen only `v`. What a variant holds is chosen by the
+  // sender for each value, and decode() relies on a valid type.
   switch (shapeOfType(type)) {
     case SignatureShape::kTaken:
       return decode(type, level);
@@ -170,6 +179,8 @@ Value Decoder::decodeArray(std::string_view type, unsigned level) {
   if (!reader_.enterArray(alignmentOf(elementType.front()), outerLimit)) return malformed(type);
   const std::size_t first = scratch_.values.size();
   for (std::size_t element = 0; !reader_.atLimit(); ++element) {
+    // An inner array takes its elements off the scratch again, so the elements of this one stay
+    // together.
     scratch_.values.push_back(decode(elementType, level));
     if (failed_) {
       path_.putBefore(element);
@@ -187,10 +198,12 @@ Value Decoder::decodeDictionary(std::string_view type, unsigned level) {
   if (!reader_.enterArray(8, outerLimit)) return malformed(type);
   const std::size_t first = scratch_.entries.size();
   while (!failed_ && !reader_.atLimit()) decodeEntry(type, level);
+  // What is left in the scratch is removed by decodeBody(), after an error as after a success.
   if (failed_) return {};
   reader_.leaveArray(outerLimit);
 
   Dictionary dictionary;
+  // Too large if keys occur twice, which costs memory only.
   dictionary.reserve(scratch_.entries.size() - first);
   for (DecodeScratch::Entry& entry : std::span(scratch_.entries).subspan(first)) {
     dictionary.set(entry.key, std::move(entry.value));
@@ -224,6 +237,8 @@ DecodeError Decoder::error() const {
   error.message = error.key + (error.key.empty() ? "" : ": ");
   error.message += problem_;
   error.message += " (signature \"" + error.signature + "\"";
+  // An unsupported value is found by its key. Of broken bytes, nothing but their place may be
+  // known.
   if (kind_ == Kind::kMalformed) {
     error.message += ", byte " + std::to_string(reader_.position()) + " of the body";
   }
@@ -257,6 +272,7 @@ std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expec
 std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expectedSignature,
                                       std::vector<Value>& arguments, DecodeScratch& scratch) {
   arguments.clear();
+  // Before the body is read: a client with wrong arguments gets an error and stays connected.
   if (frame.header.signature != expectedSignature) {
     return wrongSignature(frame.header.signature, expectedSignature);
   }
@@ -266,6 +282,7 @@ std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expec
     error = decoder.error();
     arguments.clear();
   }
+  // After an error too: the values of a message that was refused must not live until the next one.
   scratch.clear();
   return error;
 }

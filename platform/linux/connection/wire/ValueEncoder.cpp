@@ -57,6 +57,7 @@ std::string naturalType(const Value& value, unsigned arrays);
 
 // The type of an array whose elements have one type. `av` for any other and for an empty array.
 std::string naturalArrayType(const Array& array, unsigned arrays) {
+  // An empty array has no element that could give it a type.
   if (array.empty() || arrays > kMaxUniformNesting) return "av";
   const std::string first = naturalType(array[0], arrays);
   const bool uniform = std::all_of(array.begin() + 1, array.end(), [&](const Value& element) {
@@ -176,6 +177,7 @@ bool ValueEncoder::appendStringAs(char code, const Value& value) {
     appendSignature(text);
     return true;
   }
+  // Before anything is appended: the wire has 32 bits for a length.
   if (text.size() > kMaxMessageBytes) return false;
   if (!(code == 'o' ? isObjectPath(text) : isUtf8WithoutNul(text))) return false;
   appendText(text);
@@ -227,6 +229,7 @@ bool ValueEncoder::appendArray(std::string_view type, const Array& array, unsign
 bool ValueEncoder::appendDictionary(std::string_view type, const Dictionary& dictionary,
                                     unsigned level) {
   const std::string_view valueType = type.substr(3, type.size() - 4);
+  // Counted although D-Bus does not: some readers do, and would refuse the message.
   const unsigned entryLevel = level + 1;
   if (entryLevel > kMaxNesting) return false;
   std::size_t lengthPosition = 0;
@@ -244,6 +247,7 @@ std::size_t ValueEncoder::beginArray(std::size_t elementAlignment, std::size_t& 
   align(sizeof(std::uint32_t));
   lengthPosition = out_.size();
   appendNumber(std::uint32_t{0});
+  // The length of an array excludes the padding before its first element, also when there is none.
   align(elementAlignment);
   return out_.size();
 }
