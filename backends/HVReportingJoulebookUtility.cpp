@@ -20,6 +20,7 @@ namespace {
 
 constexpr platform::UnitLog kLog(&HVReportingJoulebookCategory, "HVReportingJoulebookUtility");
 
+// Fixed by the interface, like the names below.
 constexpr std::uint32_t kPowerLogCategory = 28;
 constexpr std::string_view kEngineEvent = "Oxbow_Haptics";
 constexpr std::string_view kLeakEvent = "LeakedHapticsSessionInfo";
@@ -67,6 +68,7 @@ Dictionary leakPayload(const Dictionary& message, const Key& key, const Value& a
   static const Key clients("Active_Clients");
   Dictionary payload;
   payload.set(key, activeTime);
+  // Unlike a missing time stamp, a missing number of clients is not logged; this is required.
   if (const Value* active = message.find(clients)) payload.set(clients, *active);
   return payload;
 }
@@ -85,6 +87,7 @@ void HVReportingJoulebookUtility::handleEvent(const platform::Message& message,
   static const Key engineOnTime("EngineOnTime");
   static const Key activeTime("Haptic_Active_Hardware_Time_Seconds");
   counters().received.add();
+  // A message with both keys is an engine report only; this is required.
   if (const Value* onTime = message->find(engineOnTime)) {
     logEvent(kEngineEvent, enginePayload(*message, *onTime, *session));
   } else if (const Value* leaked = message->find(activeTime)) {

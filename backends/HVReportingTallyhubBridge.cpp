@@ -40,6 +40,8 @@ class EventName {
 Dictionary makePayload(const Message& message, const HVReportingSession& session) {
   static const Key key("HostApplicationDisplayID");
   Dictionary payload = message.value_or(Dictionary{});
+  // Replaces what the message itself has under this key: only the session's configuration counts.
+  // This is required.
   payload.set(key, HVReportingUtilityRetrieveAppName(session.configuration()));
   return payload;
 }
@@ -65,6 +67,8 @@ void HVReportingTallyhubBridge::handleEvent(const Message& message, AudioEventCa
   const EventName ofAll{"com.tarno.halvox.", categoryText.domain, categoryText.name, ".", typeText};
   const EventName ofService{"com.tarno.",      serviceName, ".",     categoryText.domain,
                             categoryText.name, ".",         typeText};
+  // This order is required. Send nothing between the two: the store keeps consecutive events with
+  // equal payloads as one record.
   sendIfUsed(ofAll.text(), message, session);
   sendIfUsed(ofService.text(), message, session);
 }

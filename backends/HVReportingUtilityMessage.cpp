@@ -32,6 +32,7 @@ Dictionary HVReportingUtilityAddAudioMessageTag(const Dictionary& dictionary,
 
 Dictionary HVReportingUtilityRemoveWhiteSpaceFromKeys(const Dictionary& dictionary) {
   const auto hasBlank = [](const Dictionary::Entry& entry) { return entry.key.hasBlank(); };
+  // Nearly every message takes this way out: a key remembers whether it has a blank.
   if (std::none_of(dictionary.begin(), dictionary.end(), hasBlank)) return dictionary;
 
   Dictionary cleaned;

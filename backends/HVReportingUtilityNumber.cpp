@@ -106,6 +106,7 @@ std::optional<std::string> HVReportingUtilityBucketNumberToString(
   double distance = -1;
   for (const Value& bucket : buckets) {
     const double next = std::fabs(number.toDouble() - bucket.toDouble());
+    // Strictly farther: of two equally near buckets the later one wins.
     if (distance >= 0 && next > distance) break;
     chosen = &bucket;
     distance = next;

@@ -10,6 +10,7 @@ bool HVReportingInternalBuildAnswer::isInternalBuild() {
   std::call_once(once_, [this] {
     const auto answer = platform::deviceProperties().copyDeviceProperty("InternalBuild");
     if (!answer.has_value() || !answer->isNumber()) return;
+    // A number such as 1 is not a boolean and counts as no answer.
     if (answer->numberKind() == platform::NumberKind::kBool) internalBuild_ = answer->toBool();
   });
   return internalBuild_;

@@ -11,6 +11,7 @@ namespace {
 constexpr std::uint32_t kLowHalf = 0x0000FFFF;
 constexpr std::uint32_t kHighHalf = 0xFFFF0000;
 constexpr std::uint32_t kFirstWithHighHalf = 0x00010000;
+// All bits set is the category of the summary event, which has no domain.
 constexpr std::uint32_t kLastWithHighHalf = 0xFFFFFFFE;
 
 constexpr std::array<std::string_view, 16> kCategoryNames = {

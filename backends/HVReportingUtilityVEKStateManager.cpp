@@ -52,6 +52,9 @@ void HVReportingUtilityVEKStateManager::handleEvent(
   static const Key activeTime("Haptic_Active_Hardware_Time_Seconds");
   if (message->find(activeTime) == nullptr) return;
   counters().received.add();
+  // Compared with the time stamps, unlike a session's history: a client that repeats a report gets
+  // new stamps, so only one message that is sent to several sessions repeats itself. This is
+  // required.
   if (*message == messageCache()) {
     counters().repeated.add();
     return;
@@ -80,6 +83,7 @@ void HVReportingUtilityVEKStateManager::takeSnapshot(AudioEventCategory category
   reporter->requestSnapshot(
       signature, kSnapshotSeconds, std::nullopt, std::nullopt,
       [](const Dictionary& response) { kLog.info("Response from ailmentReporter : ", response); });
+  // Not before the request, and the second report is not kept; both are required.
   setLeakedHapticsSessionCounter(0);
   setMessageCache({});
 }

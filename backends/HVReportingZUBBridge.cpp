@@ -52,6 +52,7 @@ std::int32_t secondsUnder(const Dictionary& message, const Key& key) {
   if (value == nullptr) return 0;
   const std::int64_t seconds =
       value->isString() ? leadingInteger(value->string()) : value->toInt64();
+  // Keeps the low 32 bits; this is required.
   return static_cast<std::int32_t>(seconds);
 }
 
@@ -89,6 +90,7 @@ void HVReportingZUBBridge::handleEvent(const platform::Message& message,
                                        const std::shared_ptr<HVReportingSession>& /*session*/) {
   if (type != AudioEventType::kIssueDetector || !message.has_value()) return;
   counters().received.add();
+  // Posted even if all keys are missing: that a client saw an issue counts.
   platform::metrics().postIssueMetric(kAudioIssueDetectedMetricID, makeMetric(*message));
   counters().delivered.add();
 }

@@ -68,6 +68,8 @@ void HVReportingClientServerInstance::setClientProcessName(std::optional<std::st
 
 HVReportingClientServerInstance::Session HVReportingClientServerInstance::findReportingSessionForID(
     ReporterID reporterID, Lookup lookup) const {
+  // ID 0 is not excluded: a client may have created a session under it. Requests that exclude it do
+  // so themselves.
   if (const auto own = sessions_.find(reporterID); own != sessions_.end()) return own->second;
   if (lookup == Lookup::kOwnSessions) return nullptr;
   const Delegate delegate = delegate_.lock();
@@ -89,6 +91,8 @@ void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
   });
 }
 
+// The I/O thread may run the brief requests itself. Starts, stops and destroys are not brief: they
+// can wait for the drivers, a trace or a file, and would hold up every connection meanwhile.
 void HVReportingClientServerInstance::createReportingSession(ReporterID reporterID, BoolReply reply,
                                                              RequestContext context) {
   queueRequest(platform::JobWeight::kBrief, std::move(context),
@@ -140,6 +144,7 @@ void HVReportingClientServerInstance::sendMessage(platform::Message message,
                                                   ReporterIDs reporterIDs, ErrorReply reply,
                                                   RequestContext context) {
   ResourceCharge charge(account_, message ? message->memorySize() : 0);
+  // Looked up here, on the connection's thread: when the job runs, the sender may have ended.
   auto senderName = senderProcessName(type, context.sender);
   queueRequest(
       platform::JobWeight::kBrief, std::move(context),

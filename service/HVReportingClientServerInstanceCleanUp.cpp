@@ -32,6 +32,8 @@ void HVReportingClientServerInstance::note(const Session& session, SessionChange
 }
 
 void HVReportingClientServerInstance::handleConnectionError() {
+  // Not brief, because it stops sessions. The job holds the client: the connection may release it
+  // first.
   reportingQueue()->async(platform::JobWeight::kMayBlock,
                           [client = shared_from_this()] { client->carryOutConnectionError(); });
 }
@@ -48,6 +50,7 @@ void HVReportingClientServerInstance::carryOutConnectionError() {
   for (const auto& [reporterID, session] : sessions_) {
     if (session->started()) session->stop();
   }
+  // Only after all of them have been stopped; this order is required.
   while (!sessions_.empty()) removeSession(sessions_.begin(), delegate);
   delegate->removeClient(*this);
   kServiceLog.notice("removing ", processIdentifier_, " from the server client list");

@@ -97,6 +97,8 @@ void HVReportingClientServerInstance::sendToNamedSessions(const MessageRequest& 
                                                           const Delegate& delegate) const {
   bool delivered = false;
   for (const ReporterID reporterID : *request.reporterIDs) {
+    // An ID that is unknown is skipped silently, and one that is named twice gets the message
+    // twice. Both are required.
     if (reporterID == kNoReporterID) continue;
     const Session session = findReportingSessionForID(reporterID, Lookup::kAcrossAllClients);
     if (session == nullptr) continue;
@@ -126,6 +128,8 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
 
 void HVReportingClientServerInstance::sendStandalone(const MessageRequest& request,
                                                      const Delegate& delegate) const {
+  // The back-ends need a session, so a message without one gets a temporary one. It is never
+  // started and enters no map; the queued payloads hold it until they are built.
   const auto session = std::make_shared<HVReportingSession>(
       kStandaloneReporterID,
       HVReportingSession::ProcessIdentifiers{platform::process().ownProcessIdentifier()});

@@ -79,6 +79,7 @@ void HVReportingClientServerInstance::carryOutCreate(ReporterID reporterID,
   kServiceLog.debug("creating session for reporter ", number(reporterID));
   emitTracePoint(ReportingTracePoint::kCreateRequest);
   const Delegate delegate = delegate_.lock();
+  // The ID is not checked: 0 and an ID in use are accepted. This is required.
   const auto session = std::make_shared<HVReportingSession>(
       reporterID, HVReportingSession::ProcessIdentifiers{processIdentifier_});
   putSession(session, delegate);
@@ -119,6 +120,8 @@ void HVReportingClientServerInstance::carryOutSetConfiguration(
     const platform::Dictionary& configuration, ReporterID reporterID, const BoolReply& reply) {
   kServiceLog.debug("setting configuration");
   const Session session = findReportingSessionForID(reporterID, Lookup::kOwnSessions);
+  // Unlike setServiceType(), this accepts ID 0 if the client has created a session under it. This
+  // is required.
   if (session != nullptr) session->updateConfigurationWithContentsOfConfiguration(configuration);
   reply(std::nullopt, true);
 }
@@ -142,6 +145,7 @@ void HVReportingClientServerInstance::begin(const Session& session, const Delega
   session->setTlmReportingEnabled(mayUseLink(delegate));
   session->start();
   note(session, SessionChange::kStarted, delegate);
+  // After the start: the report covers only what the drivers count from here on.
   if (delegate != nullptr) session->setDriverSnapShot(delegate->getSnapShot());
   deliverHeldReply(*session);
   startReplies().heldBack.add();
@@ -167,6 +171,8 @@ void HVReportingClientServerInstance::carryOutStop(ReporterID reporterID, const 
 }
 
 void HVReportingClientServerInstance::end(const Session& session, const Delegate& delegate) {
+  // The driver messages come first, because only a started session records and forwards them. The
+  // snapshot is used up then. The held reply of the start precedes the reply to this stop.
   if (delegate != nullptr) delegate->sendDriverLogsForSession(session);
   session->setDriverSnapShot(std::nullopt);
   session->stop();
@@ -209,6 +215,7 @@ void HVReportingClientServerInstance::carryOutReporterIDValid(ReporterID reporte
   reply(std::nullopt, result);
 }
 
+// Lists sessions that are not started, too. The only request that logs nothing. Both are required.
 void HVReportingClientServerInstance::carryOutGetAllReporters(const ReportersReply& reply) const {
   std::vector<ReporterID> reporters;
   if (const Delegate delegate = delegate_.lock()) {

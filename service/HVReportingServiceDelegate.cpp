@@ -60,6 +60,7 @@ void handleInvalidation(const WeakClient& weakClient, platform::ProcessID pid) {
   const auto name = client == nullptr ? std::nullopt : client->clientProcessName();
   const std::string shownName = name.value_or("unknown");
   const platform::Value uptime = clientUptime(start, pid, shownName);
+  // The line has whole seconds, the event below has fractions.
   kServiceLog.notice("invalidationHandler: connection exited process=", shownName,
                      " uptime_sec=", uptime.toInt64());
   if (name.has_value()) {
@@ -84,6 +85,8 @@ std::vector<std::shared_ptr<HVReportingSession>> sessionsOf(
 
 }  // namespace
 
+// This order is required. The queue exists first, because notifications are delivered on it. The
+// drivers are subscribed to here, before any client can connect, and never again.
 HVReportingServiceDelegate::HVReportingServiceDelegate()
     : defaults_((createReportingQueue(), HVReportingDefaults())), features_(makeFeatures()) {
   listenForFeatureStateChanges();
@@ -98,6 +101,9 @@ bool HVReportingServiceDelegate::listenerShouldAcceptNewConnection(
     const std::shared_ptr<platform::NSXPCConnection>& connection) {
   const platform::ProcessID pid = connection->processIdentifier();
   kServiceLog.notice("newConnection: ", connection->description());
+  // The client is queued for registration before the connection is resumed: its first request then
+  // finds it registered, since the queue is serial. Everything here holds the client weakly, so
+  // that the connection alone keeps it until then.
   const WeakClient weakClient = exportClient(*connection);
   reportingQueue()->async(platform::JobWeight::kBrief, [delegate = shared_from_this(), weakClient] {
     if (const Client client = weakClient.lock()) {
@@ -146,6 +152,8 @@ bool HVReportingServiceDelegate::isReportingEnabled() const {
 
 HVReportingServiceDelegateProtocol::Sessions
 HVReportingServiceDelegate::getAllActiveReportingSessions() const {
+  // The walk over all clients serves only the log lines. The index has the same sessions in the
+  // same order.
   if (!HVReportingServiceDelegateCategory().isEnabled(platform::LogLevel::kDefault)) {
     return index_.activeSessions();
   }
@@ -197,6 +205,7 @@ void HVReportingServiceDelegate::handleEventForVEK(
     const std::shared_ptr<HVReportingSession>& session,
     std::optional<std::string_view> processName) {
   if (!HVReportingUtilityIsInternalBuild()) return;
+  // Not null here: the answer about internal builds never changes within a process.
   vekStateManager_->handleEvent(message, category, type, session, processName);
 }
 

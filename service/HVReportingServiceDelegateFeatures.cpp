@@ -55,6 +55,8 @@ Dictionary HVReportingServiceDelegate::HVReportingDefaults() {
     // A value without a text counts as missing.
     if (auto name = store.stringForKey(kDeviceNameKey)) defaults.set(kDeviceNameKey, *name);
   }
+  // In spite of its name the value disables nothing: it is only handed on. Without a setting it is
+  // the number 0, not false. Both are required.
   if (store.objectForKey(kDisableReportingKey).has_value()) {
     defaults.set(kDisableReportingKey, store.boolForKey(kDisableReportingKey));
   } else {
@@ -82,6 +84,7 @@ platform::Message HVReportingServiceDelegate::getFeaturesState() const {
     auto value = platform::preferences().CFPreferencesCopyValue(feature, domain, kUserName);
     if (value.has_value()) state.set(feature, *std::move(value));
   }
+  // Tested before the time stamps are added, which are not a setting.
   if (state.empty()) return std::nullopt;
   stamp(state);
   return state;
@@ -103,6 +106,7 @@ void HVReportingServiceDelegate::listenForFeatureStateChanges() {
         [this, alive = std::weak_ptr<const bool>(alive_)](platform::NotifyToken fired) {
           if (!alive.expired()) handleFeatureChange(fired);
         });
+    // Stored after a failure too, as 0. A failed registration is not tried again; this is required.
     descriptor.set(kNotifyTokenKey, token);
     kServiceLog.notice("notify setup result ", status, " token ", token);
   }

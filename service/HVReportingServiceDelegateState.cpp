@@ -50,6 +50,8 @@ void HVReportingServiceDelegate::offerState() {
 }
 
 platform::Dictionary HVReportingServiceDelegate::describeState() const {
+  // Every client is counted even if it is not described: a capture must show that something is
+  // missing.
   std::size_t room = kMostDescribed;
   std::uint64_t sessions = 0;
   std::vector<platform::Value> described;

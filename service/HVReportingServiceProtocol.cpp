@@ -160,6 +160,8 @@ void invokeKillService(ExportedObject& object, Invocation&& request) {
 constexpr MethodEffect kMore = MethodEffect::kMayHoldMore;
 constexpr MethodEffect kNoMore = MethodEffect::kHoldsNoMore;
 
+// The effects decide what a client over its limit may still ask for. Whatever lets it recover,
+// above all stops and destroys, holds no more.
 constexpr std::array kMethods{
     InterfaceMethod{"createReportingSession", "x", "b", MethodEffect::kMakesSession, invokeCreate},
     InterfaceMethod{"setServiceType", "qx", "b", kNoMore, invokeSetServiceType},
@@ -171,6 +173,7 @@ constexpr std::array kMethods{
     InterfaceMethod{"destroyReportingSession", "x", "b", kNoMore, invokeDestroy},
     InterfaceMethod{"reporterIDValid", "x", "a{sv}", kNoMore, invokeReporterIDValid},
     InterfaceMethod{"getAllReporters", "", "ax", kNoMore, invokeGetAllReporters},
+    // Any user who can connect could otherwise end the service for all others.
     InterfaceMethod{"killService", "", "b", kNoMore, invokeKillService, nullptr,
                     MethodAccess::kOwner},
 };

@@ -7,6 +7,7 @@
 namespace halvox {
 
 void SessionIndex::addClient(const Client& client) {
+  // Places are never reused: a client that reconnects comes after all others.
   places_.emplace(&client, static_cast<Place>(++placesGiven_));
 }
 
@@ -37,6 +38,7 @@ void SessionIndex::noteChange(const Client& client, const Session& session, Sess
 
 void SessionIndex::add(Place place, const Client& client, const Session& session) {
   Holders& holders = holders_[session->reporterID()];
+  // The client that was registered first stays in front, whichever created its session first.
   const auto later = std::ranges::upper_bound(holders, place, {}, &Holder::place);
   holders.insert(later, Holder{place, &client, session});
 }
@@ -53,6 +55,7 @@ void SessionIndex::removeStarted(Place place, const Session& session) {
   const auto ofClient = started_.find(place);
   if (ofClient == started_.end()) return;
   const auto known = ofClient->second.find(session->reporterID());
+  // Another session may have taken the ID meanwhile; that one stays.
   if (known == ofClient->second.end() || known->second != session) return;
   ofClient->second.erase(known);
   if (ofClient->second.empty()) started_.erase(ofClient);

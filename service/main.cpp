@@ -36,10 +36,13 @@ int serve(const Configuration& configuration) {
     static_cast<void>(adapters.close());
     return refuse(failure->exitStatus, failure->description);
   }
+  // After the services are installed, which its constructor uses. Nothing is accepted before
+  // resume(), which returns when the service is asked to end.
   const auto delegate = std::make_shared<HVReportingServiceDelegate>();
   platform::NSXPCListener& listener = platform::connections().serviceListener();
   listener.setDelegate(*delegate);
   listener.resume();
+  // A thread that did not end may still use the adapters, so nothing is destroyed.
   if (!adapters.close()) std::quick_exit(EXIT_SUCCESS);
   return EXIT_SUCCESS;
 }

@@ -17,7 +17,8 @@ namespace {
 using platform::Dictionary;
 using platform::Message;
 
-// The category and type of the summary event: all bits set.
+// The category and type of the summary event: all bits set. Neither is in the vocabulary's tables;
+// both are required. Their texts are "Undefined" and "Unknown".
 constexpr AudioEventCategory kSummaryCategory{0xFFFFFFFF};
 constexpr AudioEventType kSummaryType = AudioEventType::kUnknown;
 
@@ -41,6 +42,8 @@ HVReportingSession::HVReportingSession(ReporterID reporterID, ProcessIdentifiers
   emitTracePoint(ReportingTracePoint::kSessionCreated);
 }
 
+// Does not stop the session: a started one that is replaced under its ID ends without a report.
+// This is required.
 HVReportingSession::~HVReportingSession() {
   emitTracePoint(ReportingTracePoint::kSessionDestroyed);
   kSessionLog.info("deallocing this session ", number(reporterID()));
@@ -70,6 +73,9 @@ void HVReportingSession::appendDescription(std::string& text) const {
   text += started() ? ",started=1" : ",started=0";
 }
 
+// The history is new for every run: a message that repeats one of the previous run is recorded
+// again. The link's start is queued here, ahead of the run's messages, which wait there until the
+// discovery has ended.
 void HVReportingSession::start() {
   kSessionLog.debug("starting session owned by ", number(reporterID()));
   if (started()) {
@@ -89,6 +95,8 @@ void HVReportingSession::stop() {
   if (!started()) return;
   kSessionLog.debug("ending session ", number(reporterID()));
   emitTracePoint(ReportingTracePoint::kSessionStopped);
+  // This order is required. The volume messages become part of the history first, so the file and
+  // the summary event contain them; the file does not contain the summary event.
   sendVolumeMessages();
   summary_.writeFile();
   sendSummaryEvent();
@@ -97,6 +105,7 @@ void HVReportingSession::stop() {
   tracing_.stop();
   // Destroyed at the end of this function, without the lock: a long history takes its time.
   const std::optional<MessageHistory> history = history_.end();
+  // Last: the messages of the stop above are those of a started session.
   started_.store(false, std::memory_order_release);
 }
 
@@ -109,6 +118,8 @@ void HVReportingSession::sendVolumeMessages() {
   });
 }
 
+// Goes through the session only. Unlike a volume message it is not sent to the analytics service;
+// this is required.
 void HVReportingSession::sendSummaryEvent() {
   const Message summary = summary_.createEvent();
   if (!summary.has_value()) return;
@@ -135,6 +146,8 @@ void HVReportingSession::sendMessage(const Message& message, AudioEventCategory 
       HVReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(Dictionary())), category, type);
   const bool isRedundant = history_.record(category, type, tagged);
   emitTracePoint(ReportingTracePoint::kMessageSent);
+  // Read here and not in the link's job: by the time the job runs, the session may have been
+  // stopped or started again. Read after the message was recorded; this order is required.
   const bool wasStarted = started();
   if (tlmReportingEnabled()) {
     link_.submit(shared_from_this(), {.original = message,
@@ -145,6 +158,7 @@ void HVReportingSession::sendMessage(const Message& message, AudioEventCategory 
                                       .isRedundant = isRedundant,
                                       .sender = sender != nullptr ? sender : held_.account()});
   }
+  // The sender does not wait for the link and never hears of its failures.
   if (reply) reply(std::nullopt);
 }
 

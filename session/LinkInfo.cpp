@@ -12,6 +12,7 @@ using platform::Dictionary;
 Dictionary LinkStart::sessionInfo(ReporterID reporterID,
                                   const platform::TLMSecureHierarchyToken& token) const {
   const bool batch = HVReportingUtilityShouldBatchTLMReportingEventsForServiceType(serviceType);
+  // Both keys about batching are required, although each is the negation of the other.
   Dictionary info{{platform::kTLMReportingSessionInfoClientType, kLinkClientType},
                   {platform::kTLMReportingSessionInfoClientVersion, kHVReportingVersionNumber},
                   {platform::kTLMReportingSessionInfoSessionID, number(reporterID)},
@@ -28,6 +29,8 @@ Dictionary LinkStart::userInfo() const {
   Dictionary info{
       {platform::kTLMReportingUserInfoClientName, kLinkClientName},
       {platform::kTLMReportingUserInfoServiceName, std::string(serviceName) + "_session"}};
+  // Last, because an entry of the configuration replaces the service's own of the same key. This is
+  // required.
   info.merge(configuration);
   return info;
 }

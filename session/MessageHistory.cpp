@@ -36,6 +36,8 @@ std::size_t countLastingEntries(const Dictionary& message) {
          static_cast<std::size_t>(std::count_if(message.begin(), message.end(), isVolatile));
 }
 
+// Keys are unique within a dictionary. If both have the same number of compared entries and each
+// entry of the left one is in the right one, the right one has no others.
 bool equalInAnyOrder(const Dictionary& left, const Dictionary& right) {
   if (countLastingEntries(left) != countLastingEntries(right)) return false;
   return std::all_of(left.begin(), left.end(), [&right](const Dictionary::Entry& entry) {
@@ -57,6 +59,8 @@ std::uint64_t MessageHistory::count(const std::string& base) const {
 }
 
 MessageHistory::Base& MessageHistory::base(AudioEventCategory category, AudioEventType type) {
+  // Several codes can have one text: all unlisted types are "Generic". They share a base, and with
+  // it a count.
   const std::uint64_t code = codeOf(category, type);
   if (const auto known = basesByCode_.find(code); known != basesByCode_.end()) {
     return *known->second;
@@ -74,6 +78,7 @@ MessageHistory::Base& MessageHistory::base(AudioEventCategory category, AudioEve
 
 MessageHistory::Base& MessageHistory::baseWithText(std::string text) {
   const auto [place, isNew] = bases_.try_emplace(text, text);
+  // The text is stored twice: as the key and in the base.
   if (isNew) memorySize_ += sizeof(Base) + 2 * text.size() + kTableEntryOverhead;
   return place->second;
 }
@@ -84,6 +89,7 @@ const Dictionary* MessageHistory::newestMessage(const Base& base) const {
 
 void MessageHistory::append(Base& base, Dictionary message) {
   memorySize_ += sizeof(Entry) + message.memorySize();
+  // The position of the entry that is added below.
   base.newest_ = entries_.size();
   ++base.count_;
   entries_.emplace_back(base, base.count_, std::move(message));
@@ -97,6 +103,8 @@ bool equalApartFromVolatileKeys(const Dictionary& left, const Dictionary& right)
     const Dictionary::Entry* other = right.begin();
     const Dictionary::Entry* entry = left.begin();
     while (entry != left.end() && entry->key == other->key) {
+      // Values first: a benchmark showed that looking up the volatile keys for every entry cost
+      // most of a comparison.
       if (!(entry->value == other->value) && !isVolatile(*entry)) return false;
       ++entry;
       ++other;

@@ -39,6 +39,7 @@ void SessionHistory::begin() { history_.set(MessageHistory()); }
 
 std::optional<MessageHistory> SessionHistory::end() {
   std::optional<MessageHistory> history = history_.take();
+  // The charge ends here: the history itself does not know the account.
   held_.change(history.has_value() ? history->memorySize() : 0, 0);
   return history;
 }
@@ -67,6 +68,9 @@ bool SessionHistory::recordLocked(const Lock& history, AudioEventCategory catego
   MessageHistory& messages = **history;
   const std::size_t before = messages.memorySize();
   MessageHistory::Base& base = messages.base(category, type);
+  // Only the newest message of the same category and type is compared, however old it is. Of the
+  // messages A, B, A all three are recorded, and two equal messages an hour apart are a repetition.
+  // Both are required.
   const platform::Dictionary* previous = messages.newestMessage(base);
   if (previous != nullptr && !isExemptFromSuppression(category, type) &&
       equalApartFromVolatileKeys(*previous, message)) {

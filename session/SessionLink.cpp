@@ -22,6 +22,7 @@ using platform::JobWeight;
 using platform::WaitOutcome;
 
 constexpr std::string_view kQueueLabel = "com.tarno.halvox.session.tlmreporting";
+// How long messages are held back at most while no back-end has been found. The value is required.
 constexpr std::chrono::seconds kBackendTimeOut{9};
 // Estimated bytes of a waiting job and its place in the queue, in addition to its content.
 constexpr std::size_t kWaitingOverhead = 256;
@@ -52,6 +53,7 @@ const LinkCounters& counters() {
   return made;
 }
 
+// A test session never reaches the framework; this is required.
 bool mayUseFramework(AudioServiceType serviceType) {
   return HVReportingUtilityAllowSessionTransactions() && serviceType != AudioServiceType::kTest;
 }
@@ -130,6 +132,7 @@ void SessionLink::start(const Owner& owner, const LinkStart& atStart) {
 }
 
 void SessionLink::onBackendsFound(bool found) {
+  // The flag first: the job that the signal releases reads it.
   tlmReportingSessionStarted_.store(found, std::memory_order_release);
   tlmreportingBackendSemaphore()->signal();
 }
@@ -161,6 +164,8 @@ void SessionLink::submitStop(const Owner& owner) {
 
 void SessionLink::stop(const Owner& owner) {
   kLinkLog.debug("entering tlmreporting -[HVReportingSession stop]_block_invoke");
+  // Tests the type of this moment, unlike the start. A session that became a test meanwhile is
+  // neither flushed nor closed; this is required.
   if (!mayUseFramework(profile_.serviceType())) return;
   const auto open = tlmReportingSession();
   if (open == nullptr) {
@@ -207,6 +212,7 @@ void SessionLink::sendThroughFramework(const LinkMessage& message) {
   const std::uint16_t category =
       HVReportingUtilityRetrieveTLMReportingCategoryFromCategory(message.category);
   const auto open = tlmReportingSession();
+  // The order of these tests decides under which reason a message is counted.
   if (!HVReportingUtilityAllowSessionTransactions()) return counters().notAllowed.add();
   if (profile_.serviceType() == AudioServiceType::kTest) return counters().testSession.add();
   if (message.isRedundant) return counters().redundant.add();
@@ -216,11 +222,14 @@ void SessionLink::sendThroughFramework(const LinkMessage& message) {
       open, {.category = category, .type = number(message.type), .payload = message.tagged});
   if (outcome.sent) {
     counters().sent.add();
+    // The line shows the message without its tag and the category with its domain. The framework
+    // got the tag but not the domain. All of this is required.
     kSessionLog.debug("TLMReportingAgent ", *open, " : message ", message.original, " : category ",
                       number(message.category), " : type ", number(message.type));
     return;
   }
   counters().failed.add();
+  // A failure without an error is only counted; this is required.
   if (outcome.error.has_value()) {
     kSessionLog.error("error sending message ", outcome.error->description);
   }

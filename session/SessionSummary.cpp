@@ -18,8 +18,10 @@ namespace {
 
 using platform::Message;
 
+// Fixed by the interface; the platform puts its storage root in front of it.
 constexpr std::string_view kDirectory =
     "/private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
+// The readers of these files expect it. The storage root's own permissions keep others out.
 constexpr std::uint32_t kDirectoryPermissions = 0777;
 
 }  // namespace
@@ -31,6 +33,8 @@ void SessionSummary::sendVolumeMessages(const Send& send) const {
     const SessionHistory::Lock history = history_.lock();
     return history->has_value() ? walk.next(**history) : std::nullopt;
   };
+  // The line below comes before the messages and only if there are any, so the first is found
+  // before it is logged.
   Message message = next();
   if (!message.has_value()) return;
   kSessionLog.notice("sending volume event for reporter ", number(profile_.reporterID()));
@@ -51,11 +55,14 @@ Message SessionSummary::createEvent() const {
 void SessionSummary::writeFile() const {
   if (!HVReportingUtilityIsInternalBuild() || history_.size() == 0) return;
   platform::FileService& files = platform::files();
+  // Not fatal: the file is tried anyway, and its failure is logged as well. Both lines are
+  // required.
   if (const auto error = files.createDirectory(kDirectory, kDirectoryPermissions)) {
     kSessionLog.error("can't create logging directory at ", kDirectory, ": ", error->description);
   }
   const auto file = files.createJsonArrayFile(kDirectory, fileName());
   {
+    // Held until all of it has been written: the file shows one moment of the history.
     const SessionHistory::Lock history = history_.lock();
     if (!history->has_value()) return;
     for (const MessageHistory::Entry& entry : **history) {

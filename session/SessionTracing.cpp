@@ -109,6 +109,7 @@ void SessionTracing::setupTracing(const std::string& path) {
     state->params = std::move(params);
     state->runner.swap(runner);  // destroys the former runner after the lock
   }
+  // Required here: the start marks the session as traced only when a runner exists.
   setStartedTracing(false);
   kSessionLog.info("Setting up tracing for ", profile_.serviceName());
 }
@@ -157,6 +158,8 @@ void SessionTracing::kqTraceDidStart(const std::optional<Error>& error) {
   }
   {
     const auto state = state_.lock();
+    // The session stays marked as traced, so that its stop waits for a completion that never comes.
+    // This is required; see stop().
     state->session = nullptr;
     state->config = nullptr;
   }

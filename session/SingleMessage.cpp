@@ -19,6 +19,7 @@ namespace {
 
 using platform::Dictionary;
 
+// The delay is required.
 constexpr std::chrono::seconds kSingleMessageDelay{1};
 constexpr std::int64_t kNoLinkSession = -1;  // the framework's session ID outside any session
 constexpr int kMaxAlarmDelta = 59;
@@ -46,6 +47,8 @@ const SingleMessageCounters& counters() {
 // is only logged: every message waits exactly one second. This is required.
 std::int64_t drawDelta(AudioServiceType serviceType) {
   if (serviceType != AudioServiceType::kAlarms) return 0;
+  // Any uniform generator will do, because the number is only logged. One for each thread needs no
+  // lock.
   thread_local std::minstd_rand generator{std::random_device{}()};
   return std::uniform_int_distribution<int>(0, kMaxAlarmDelta)(generator);
 }
@@ -61,6 +64,8 @@ std::optional<platform::Error> handOver(const SingleMessage& single) {
       {platform::kTLMReportingUserInfoClientName, kLinkClientName},
       {platform::kTLMReportingUserInfoServiceName,
        HVReportingUtilityGenerateServiceNameFromServiceType(single.serviceType)}};
+  // The message of a session was cleaned before. One that no session took comes here as the client
+  // sent it.
   const Dictionary payload =
       HVReportingUtilityRemoveWhiteSpaceFromKeys(single.message.value_or(Dictionary()));
   platform::TLMReportingOutcome outcome = platform::tlmReporting().TLMReportingSendOneMessage(

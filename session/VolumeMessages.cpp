@@ -23,9 +23,11 @@ const Key kVolumeBucketedKey("RQSessionVolumeBucketed");
 const Key kPlaySecondsKey("play_seconds");
 const Key kPlaySecondsBucketedKey("play_secondsBucketed");
 
+// Four digits show every sixteenth exactly; the seconds are whole numbers.
 constexpr int kVolumeFractionDigits = 4;
 constexpr int kSecondsFractionDigits = 0;
 
+// Steps of one sixteenth.
 const Array& volumeBuckets() {
   static const Array buckets{0,      0.0625, 0.125,  0.1875, 0.25,   0.3125, 0.375,  0.4375, 0.5,
                              0.5625, 0.625,  0.6875, 0.75,   0.8125, 0.875,  0.9375, 1.0};
@@ -60,6 +62,8 @@ bool saysPlaying(const Dictionary& message) {
 }  // namespace
 
 std::optional<Dictionary> VolumeIntervals::add(const Dictionary& message) {
+  // Kept even by messages without a volume, and before the test below: the message that ends an
+  // interval gives it its own format, devices and process. This is required.
   keepIfPresent(message, kFormatKey, format_);
   keepIfPresent(message, kDevicesKey, devices_);
   keepIfPresent(message, kProcessKey, process_);
@@ -81,6 +85,8 @@ std::optional<Dictionary> VolumeIntervals::add(const Dictionary& message) {
 }
 
 Dictionary VolumeIntervals::makeMessage(double seconds) const {
+  // Has the volume that was playing, not the one that ended the interval. The length is stored in
+  // single precision, but its bucket is chosen by the double. Both are required.
   return {{kFormatKey, format_},
           {kDevicesKey, devices_},
           {kProcessKey, process_},

@@ -46,6 +46,7 @@ void TraceInterval::processTracepointsSingleThread(const Session& session, const
   std::map<std::uint64_t, std::uint64_t> starts;  // by thread: the begin that waits for its end
   Discarded discarded;
   for (const platform::trace_point& event : events) {
+    // Begins are tested first: a code that is both a begin and an end is a begin, here and below.
     if (event.debugid == codes_.begin) {
       const bool isNew = starts.insert_or_assign(event.threadid, event.timestamp).second;
       if (!isNew) ++discarded.starts;
@@ -75,6 +76,8 @@ void TraceInterval::processTracepointsAnyThread(const Session& session, const Ev
       } else {
         addInterval(session, start, event.timestamp);
       }
+      // Cleared even if there was no start; a tick of 0 cannot be told from none. Both are
+      // required.
       start = kNoStart;
     }
   }

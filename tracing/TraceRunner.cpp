@@ -22,6 +22,7 @@ constexpr std::string_view kResultsFileName = "tracing_results.ssj";
 constexpr std::string_view kProductName = "HVReporting";
 constexpr std::uint32_t kResultsVersion = 4;
 constexpr std::uint32_t kNoFlags = 0;
+// The readers of these files expect it. The storage root's own permissions keep others out.
 constexpr std::uint32_t kDirectoryPermissions = 0777;
 constexpr std::string_view kQueueLabel = "Tracing Queue";
 // The range of identifiers that is recorded: what the audio frameworks emit.
@@ -64,6 +65,7 @@ class TraceRunner::Recording {
     const int range = platform::ktrace().ktrace_events_range(
         session_, kFirstIdentifier, kLastIdentifier,
         [this](const platform::trace_point& event) { events_.push_back(event); });
+    // Not fatal: the recording starts anyway and records nothing; this is required.
     if (range != 0) kLog.error("Could not set up ktrace range, error: ", range);
   }
   void startTracing(const std::shared_ptr<platform::DispatchQueue>& queue) {
@@ -125,6 +127,8 @@ void TraceRunner::createTraceFromTraceParams(const TraceParams* params) {
       params->type == TraceType::kKernelTrace ? Trace::Kind::kKernelTrace : Trace::Kind::kSignpost,
       completions_);
   for (const TraceDataParams& point : params->tracePoints) {
+    // An interval whatever the kind; this is required. For an impulse it finds nothing, because
+    // begin and end are equal.
     recording->trace().addTraceDataToCollect(std::make_unique<TraceInterval>(
         point.name,
         TraceIntervalCodes{
@@ -171,6 +175,7 @@ void TraceRunner::stopTracingandProcessResults() {
         recording->tracingCompletionHandler();
       }
     });
+    // One at a time: the next trace is ended only when this one has completed; this is required.
     completions_->signals->wait();
     if (trace.isKernelTrace()) results_[&trace] = trace.getResults();
     kLog.info("Completed trace.... ", completions_->count.load(std::memory_order_relaxed), ",   ",
