@@ -25,6 +25,7 @@ std::optional<Number> parseWhole(std::string_view text) {
   return number;
 }
 
+// Refuses "inf" and "nan", which the conversion accepts.
 std::optional<double> parseReal(std::string_view text) {
   double number = 0;
   const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
@@ -85,6 +86,7 @@ Parsed<std::uint64_t> parseCount(std::string_view text) {
 }
 
 Parsed<client::Category> parseCategory(std::string_view text) {
+  // Numbers first: a category can have any 32 bits, and most of them have no name.
   if (const auto number = parseWhole<client::Category>(text)) return *number;
   if (const auto category = client::findCategory(text)) return *category;
   if (const auto category = parseNumberInDomain(text)) return *category;
@@ -105,12 +107,14 @@ Parsed<client::ServiceType> parseServiceType(std::string_view text) {
 }
 
 Parsed<std::chrono::milliseconds> parseSeconds(std::string_view text) {
+  // About 30 years. Keeps the conversion to milliseconds and later sums of times within 64 bits.
   constexpr double kMost = 1e9;
   const auto seconds = parseReal(text);
   if (!seconds || *seconds <= 0 || *seconds > kMost) {
     return ArgumentError{"\"" + std::string(text) +
                          "\" is not a time; expected seconds, more than 0, such as 0.5 or 10"};
   }
+  // Rounded up: 0.0001 seconds must not become 0.
   return std::chrono::ceil<std::chrono::milliseconds>(std::chrono::duration<double>(*seconds));
 }
 

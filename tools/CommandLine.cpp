@@ -82,6 +82,7 @@ class HelpFormatter final : public CLI::Formatter {
 
 // Replaces the library's headings by ours; commands inherit them from the program.
 void nameThings(CLI::App& app) {
+  // Set before any command is added: commands copy these settings.
   app.set_help_flag("-h,--help", "Print this help");
   const auto formatter = std::make_shared<HelpFormatter>();
   formatter->label("SUBCOMMAND", "COMMAND");
@@ -154,6 +155,7 @@ std::string reasonOf(const CLI::ParseError& error, const CLI::App& app, const CL
   const bool isWithoutCommand = dynamic_cast<const CLI::RequiredError*>(&error) != nullptr &&
                                 command.get_require_subcommand_min() > 0 &&
                                 command.get_subcommands().empty();
+  // The library's message quotes the arguments, which may come from a script.
   if (!isWithoutCommand) return harmlessText(error.what());
   const auto rest = app.remaining(true);
   const std::string what = rest.empty()
@@ -178,6 +180,7 @@ CommandLineText describe(const CLI::ParseError& error, const CLI::App& app, Comm
 }  // namespace
 
 bool asksForJson(const std::vector<std::string>& arguments) {
+  // What follows "--" belongs to another program (trace record) and may have a --json of its own.
   const auto end = std::ranges::find(arguments, "--");
   return std::find(arguments.begin(), end, "--json") != end;
 }

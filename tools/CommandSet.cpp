@@ -19,6 +19,7 @@ CLI::App& CommandSet::addBelow(CLI::App& parent, const CommandText& text) {
   CLI::App* app = parent.add_subcommand(text.name, text.summary);
   app->group("Commands");
   addCommonOptions(*app, text.reach);
+  // Every command's help has an example; a test checks that it is there.
   app->footer((text.details.empty() ? "" : text.details + "\n\n") + "Example:\n  " + text.example);
   return *app;
 }
@@ -44,6 +45,7 @@ void CommandSet::addCommonOptions(CLI::App& app, CommandReach reach) {
 
 std::string CommandSet::readInput() {
   if (source_ == CommandSource::kScriptLine) {
+    // The standard input may be the script itself.
     throw CLI::ValidationError("JSON", "\"-\" is for single commands; in a script, write it out");
   }
   return {std::istreambuf_iterator<char>(input_), {}};

@@ -66,6 +66,8 @@ std::string textOf(const IOReportChannel& channel, std::optional<double> seconds
   }
   std::string text;
   for (const auto& state : channel.states) {
+    // Only what has counts is shown to people. JSON has all states and buckets, so that a program
+    // finds the same fields in each line.
     if (state.inTransitions == 0 && state.residency == 0) continue;
     text += " " + harmlessText(state.name) + "=" + shownCount(state.residency, seconds) + "(" +
             shownCount(state.inTransitions, seconds) + "x)";
@@ -143,6 +145,8 @@ class DriverPrinter {
     IOReportService::Name group;
     if (!request.group.empty()) group = request.group;
     channels_ = service_.IOReportCopyChannelsInGroup(group, std::nullopt, error);
+    // Errors are not tested: a group without channels is noticed by its number of channels, and the
+    // sources log theirs themselves.
     subscription_ = service_.IOReportCreateSubscription(channels_, channels_, error);
   }
 
@@ -150,6 +154,7 @@ class DriverPrinter {
 
   IOReportService::Samples sample() {
     std::optional<platform::IOReportError> error;
+    // A new moment each time: samples of one moment would have the same values.
     return service_.IOReportCreateSamples(subscription_, channels_, *service_.makeMoment(), error);
   }
 
@@ -167,6 +172,8 @@ class DriverPrinter {
     using Clock = std::chrono::steady_clock;
     auto before = sample();
     auto time = Clock::now();
+    // poll() notices during the pause that the reader is gone. A write would notice it only after
+    // the pause.
     while (out_ && isReadFor(interval, outputDescriptor)) {
       auto now = sample();
       const auto nowTime = Clock::now();
@@ -181,6 +188,8 @@ class DriverPrinter {
  private:
   static bool isReadFor(std::chrono::milliseconds time, int descriptor) {
     pollfd output{descriptor, 0, 0};
+    // Requests no events: errors and hang-ups are always reported. This is a pause that ends early
+    // when the reader closes the pipe.
     const int polled = poll(&output, 1, static_cast<int>(time.count()));
     return polled <= 0 || (output.revents & (POLLERR | POLLHUP | POLLNVAL)) == 0;
   }
@@ -225,6 +234,7 @@ ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream
   // Static, because the sources' log keeps a reference to it.
   static ErrorLog errorLog;
   platform::linux_::ownDriversCategory() = &errorLog;
+  // The sources count what they refuse. Nobody reads the counters of this program.
   platform::linux_::CounterStatisticsService statistics;
   platform::linux_::LinuxIOReportService service(
       platform::linux_::makeDriverSources(

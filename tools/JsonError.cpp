@@ -72,6 +72,7 @@ std::string foundIn(std::istream& text) {
   while (character.size() < kLongestCharacter) {
     const int byte = text.peek();
     if (byte == std::istream::traits_type::eof()) break;
+    // A whole character: its first byte alone would be shown as broken text.
     if (!character.empty() && !platform::linux_::continuesUtf8(static_cast<char>(byte))) break;
     character += static_cast<char>(text.get());
   }
@@ -97,6 +98,7 @@ std::string describeJsonError(std::istream& text, std::size_t offset, int code,
   }
   const std::string place =
       "line " + std::to_string(line) + ", column " + std::to_string(column) + ": ";
+  // The parser's own code only says that its handler stopped it.
   if (!problem.empty()) return place + problem;
   const std::string_view expected = expectationOf(code);
   if (expected.empty()) return place + std::string(sentenceOf(code));

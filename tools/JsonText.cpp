@@ -30,6 +30,9 @@ using Writer = rapidjson::Writer<rapidjson::StringBuffer>;
 // The deepest nesting that fits on the wire, where each dictionary counts twice: once for itself
 // and once for the variant around a value in it.
 constexpr int kMaxDepth = 32;
+// Full precision, because the fast conversion of the library can be wrong in the last digit.
+// Iterative, because deep nesting would overflow the stack of the recursive parser before a depth
+// could be tested.
 constexpr unsigned kParseFlags = rapidjson::kParseFullPrecisionFlag |
                                  rapidjson::kParseIterativeFlag |
                                  rapidjson::kParseValidateEncodingFlag;
@@ -47,6 +50,7 @@ class Converter {
     for (const auto& member : json.GetObject()) {
       const std::size_t length = path_.size();
       path_.append(length > 0 ? "." : "").append(textOf(member.name));
+      // JSON permits it, but a dictionary would silently drop the first value.
       if (dictionary.contains(textOf(member.name))) return fail("the key occurs twice");
       Value value;
       if (!convert(member.value, value)) return false;
@@ -74,6 +78,7 @@ class Converter {
         value = json.GetBool();
         return true;
       case rapidjson::kStringType:
+        // A D-Bus string cannot contain one.
         if (textOf(json).find('\0') != std::string_view::npos) {
           return fail("a message cannot hold a NUL character");
         }
@@ -95,6 +100,8 @@ class Converter {
   }
 
   static Value number(const rapidjson::Value& json) {
+    // Signed first: most numbers fit both kinds, and the unsigned one is only for those that are
+    // too large.
     if (json.IsInt64()) return json.GetInt64();
     if (json.IsUint64()) return json.GetUint64();
     return json.GetDouble();
@@ -225,6 +232,7 @@ std::string harmless(std::string_view text, InvalidByte treatment) {
   std::string result;
   result.reserve(text.size());
   while (!text.empty()) {
+    // Texts come from clients and archives: they may hold anything.
     const auto step = platform::linux_::nextUtf8(text);
     if (step.valid && !isHarmful(step.character)) {
       result += text.substr(0, step.length);
@@ -240,6 +248,7 @@ std::string harmless(std::string_view text, InvalidByte treatment) {
   return result;
 }
 
+// The characters that would make "key=value key=value" ambiguous.
 bool canStandWithoutQuotes(std::string_view text) {
   return !text.empty() && text.find_first_of(" \"'=\\{}[],") == std::string_view::npos;
 }
@@ -301,6 +310,7 @@ std::string harmlessText(std::string_view text) { return harmless(text, InvalidB
 std::string fieldsOfJson(std::string_view json) {
   rapidjson::Document document;
   document.Parse<kParseFlags>(json.data(), json.size());
+  // Shown as it is: a person can read more from it than from an error.
   if (document.HasParseError() || !document.IsObject()) return harmlessText(json);
   std::string fields;
   for (const auto& member : std::as_const(document).GetObject()) {

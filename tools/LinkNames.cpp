@@ -30,6 +30,7 @@ client::EventType typeOf(const StoredRecord& message) {
 std::string tagOf(const StoredRecord& message) {
   const std::string& payload = message.text(store::kLinkPayload);
   rapidjson::Document document;
+  // Iterative: a payload may be nested deeply, and the recursive parser would overflow the stack.
   document.Parse<rapidjson::kParseIterativeFlag>(payload.data(), payload.size());
   if (document.HasParseError() || !document.IsObject()) return {};
   if (!document.HasMember(kTag) || !document[kTag].IsString()) return {};
@@ -55,6 +56,8 @@ std::string domainOf(const StoredRecord& message) {
   const std::string tag = tagOf(message);
   const std::string rest = client::categoryName(categoryProperOf(message)) +
                            std::string(client::eventTypeName(typeOf(message)));
+  // A message of the link carries what its client wrote; the tag counts only if it fits the
+  // numbers.
   if (!tag.ends_with(rest)) return {};
   const std::string domain = tag.substr(0, tag.size() - rest.size());
   return isDomain(domain) ? domain : std::string();
@@ -65,6 +68,7 @@ std::string domainOf(const StoredRecord& message) {
 std::string linkCategoryName(const StoredRecord& message) {
   const Category category = categoryProperOf(message);
   const std::string name = client::categoryName(category);
+  // Numbers without a name share the name "Undefined", which would not find them again.
   const bool isNamed = client::findCategory(name) == category;
   return domainOf(message) + (isNamed ? name : std::to_string(category));
 }

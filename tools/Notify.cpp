@@ -38,6 +38,7 @@ ExitStatus postNotification(const PostNotification& request, OutputForm form, st
                     "NAME: " + platform::linux_::shownName(request.name) +
                         " cannot be a notification; expected the name of a file, without \"/\"");
   }
+  // Another file would be harmless, but a mistyped name would look like success.
   if (std::ranges::find(kNotifications, request.name) == kNotifications.end()) {
     return complain(ExitStatus::kBadArguments,
                     "NAME: nothing was posted: the service does not listen for " +
@@ -54,6 +55,7 @@ ExitStatus postNotification(const PostNotification& request, OutputForm form, st
     return complain(ExitStatus::kCannotWrite, directory.native() + ": " + error.message());
   }
   const std::filesystem::path file = directory / request.name;
+  // Not blocking, because the file may be a pipe that nobody reads.
   constexpr int kFlags = O_WRONLY | O_CREAT | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
   const UniqueFd descriptor(::open(file.c_str(), kFlags, 0644));
   // Touch a file that exists, so that its time is that of the last post.

@@ -39,6 +39,7 @@ std::string quotedText(std::string_view text) {
       quoted += '\\';
       quoted += character;
     } else if (byte < 0x20 || byte == 0x7F) {
+      // TOML does not allow these characters in a string, except for the tab.
       std::array<char, 8> escape{};
       std::snprintf(escape.data(), escape.size(), "\\u%04X", unsigned{byte});
       quoted += escape.data();
@@ -142,6 +143,8 @@ class ParsedText {
 Edited verified(std::string text, const Dictionary& expected, const ParsedText& before,
                 std::string_view key, const std::filesystem::path& file) {
   const auto after = parsePreferences(text, file);
+  // The text was edited by positions. Only reading it again shows that nothing else has changed its
+  // meaning.
   if (!after || *after != expected) return before.refusal(key);
   if (text.size() > kLargestPreferenceFile) {
     return Failure<>{file.native() + ": expected at most " +
@@ -163,6 +166,7 @@ std::string withNewLine(std::string_view text, std::size_t place, const std::str
 
 Result<PreferenceValue> parsePreferenceValue(std::string_view text, ValueForm form) {
   if (!isUtf8(text)) return Failure<>{"VALUE: expected UTF-8 text, found other bytes"};
+  // Tested before parsing: the parser is recursive.
   if (form == ValueForm::kTomlOrString && !isNestedTooDeep(text)) {
     constexpr std::string_view kKey = "v = ";
     const std::string line = std::string(kKey) + std::string(text);

@@ -37,6 +37,7 @@ Failure<> failure(const std::filesystem::path& path, int error) {
 class NewFile {
  public:
   explicit NewFile(const std::filesystem::path& target)
+      // In the same directory, because a rename does not cross file systems.
       : path_((target.parent_path() / ("." + target.filename().native() + ".XXXXXX")).native()),
         descriptor_(::mkostemp(path_.data(), O_CLOEXEC)) {}
   NewFile(const NewFile&) = delete;
@@ -53,6 +54,7 @@ class NewFile {
       if (count < 0) return false;
       text.remove_prefix(static_cast<std::size_t>(count));
     }
+    // Without it, a crash after the rename could leave an empty file.
     return ::fsync(descriptor_.get()) == 0;
   }
   // Renames the file to `target` and replaces a file of that name.
@@ -68,6 +70,7 @@ class NewFile {
 };
 
 mode_t modeOfNewFile() {
+  // The mask cannot be read without setting it, so no other thread may create a file meanwhile.
   const mode_t mask = ::umask(0);
   ::umask(mask);
   return kModeOfNewFiles & ~mask;
@@ -77,6 +80,7 @@ Result<void> replace(const std::filesystem::path& file, const std::string& text,
                      int directory) {
   NewFile made(file);
   if (!made.write(text, mode) || !made.keepAs(file)) return failure(file, errno);
+  // Without it, a crash could undo the rename.
   if (::fsync(directory) != 0) return failure(file.parent_path(), errno);
   return {};
 }
@@ -122,6 +126,7 @@ Result<void> changePreferenceFile(const std::filesystem::path& named, const Pref
                      ": another program has locked this directory; try again later"};
   }
 
+  // Read under the lock: the change is made to the text that it will replace.
   auto content = readPreferenceText(file);
   if (!content) return std::move(content).error();
   const std::optional<PreferenceText>& old = *content;

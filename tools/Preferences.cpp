@@ -81,6 +81,7 @@ ExitStatus unset(const Preferences& request, const std::filesystem::path& file,
       file,
       [&](std::string_view text, const std::filesystem::path& named) {
         auto edited = withoutPreference(text, *request.key, named);
+        // After an error the status is that of the error, not that of a missing key.
         wasThere = !edited || *edited != text;
         return edited;
       },

@@ -153,6 +153,7 @@ std::string asJson(ShowRecords::Kind kind, const StoredRecord& record) {
   const bool isIssue =
       kind == ShowRecords::Kind::kMetrics && record.number(store::kMetricID) == kAudioIssueDetected;
   const auto fields = isIssue ? audioIssueAsJson(record.text(store::kMetricMessage)) : std::nullopt;
+  // The bytes stay in the object: they are what was recorded, the fields are our reading of them.
   if (fields) json += ",\"fields\":" + harmlessJson(*fields);
   if (kind == ShowRecords::Kind::kLink) {
     json += ",\"category_name\":" + tools::quoted(linkCategoryName(record)) +
@@ -176,6 +177,8 @@ RecordFilter filterOf(const ShowRecords& request) {
     case ShowRecords::Kind::kLink:
       add(store::kLinkSessionID, request.ids);
       add(store::kLinkType, request.types);
+      // The store's filter compares numbers. The stored category has no domain, which must be read
+      // from the payload, so this is tested record by record.
       if (!request.categories.empty()) {
         filter.accepts = [categories = request.categories](const StoredRecord& record) {
           return isOfCategory(record, categories);

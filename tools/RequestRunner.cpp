@@ -71,6 +71,7 @@ class RequestRunner::Execution {
   }
   ExitStatus operator()(const Start& request) {
     const auto started = connection_->startReportingSessionForID(request.id);
+    // The request returns when the service has carried the start out. Its answer comes at the stop.
     if (!started || !request.wait) return report("start", request.id, started);
     return reportWait("start", request.id, *request.wait);
   }
@@ -193,6 +194,7 @@ class RequestRunner::Execution {
 
 ExitStatus RequestRunner::run(const Request& request, bool json, const std::string& prefix) {
   const char* command = std::visit([](const auto& asked) { return asked.kCommand; }, request);
+  // The first request connects: a script of comments needs no service.
   if (!connection_) {
     const Complaint complain(command, json ? OutputForm::kJson : OutputForm::kText, out_, errors_);
     const auto socket = namedSocket(options_, complain);

@@ -24,6 +24,7 @@ class LineReader {
     rest_.remove_prefix(start == std::string_view::npos ? rest_.size() : start);
     if (rest_.empty() || rest_.front() == '#') return false;
     word.clear();
+    // JSON to the end of the line, without the shell's rules: its quotes and backslashes stay.
     if (rest_.front() == '{') {
       const auto end = rest_.find_last_not_of(kBlanks);
       word = rest_.substr(0, end + 1);
@@ -58,6 +59,8 @@ class LineReader {
   bool takeQuoted(char quote, std::string& word) {
     rest_.remove_prefix(1);
     while (!rest_.empty() && rest_.front() != quote) {
+      // As in the shell: within double quotes a backslash escapes only a quote or another
+      // backslash, and within single quotes nothing.
       const bool escapes = quote == '"' && rest_.front() == '\\' && rest_.size() > 1 &&
                            (rest_[1] == '"' || rest_[1] == '\\');
       if (escapes) rest_.remove_prefix(1);
@@ -112,6 +115,8 @@ ExitStatus runScript(const ScriptSource& source, const CommonOptions& options, s
   std::string line;
   for (std::size_t number = 1;; ++number) {
     if (source.isPrompting) out << "halvox> ";
+    // The answers of a line are visible before the next one is read, which may take a while on a
+    // pipe.
     out << std::flush;
     if (!std::getline(source.lines, line)) break;
 
@@ -133,6 +138,7 @@ ExitStatus runScript(const ScriptSource& source, const CommonOptions& options, s
       status = runLine(list, runner, options.json, out, errors, prefix, source.lines);
     }
     if (result == ExitStatus::kDone) result = status;
+    // Also with --keep-going: the script's sessions have ended with their connection.
     if (status == ExitStatus::kNoService) break;
     if (status != ExitStatus::kDone && !source.keepsGoing) break;
   }

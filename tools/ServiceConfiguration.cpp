@@ -65,6 +65,8 @@ std::variant<Configuration, ExitStatus> serviceConfiguration(const Complaint& co
 
 std::variant<std::string, ExitStatus> namedSocket(const CommonOptions& options,
                                                   const Complaint& complain) {
+  // The client library reads $HALVOX_SOCKET itself. If it is set, the configuration is not read and
+  // cannot fail.
   if (!options.socket.empty() || isSocketInTheEnvironment()) return options.socket;
   const auto named = platform::linux_::configuredSocket();
   if (const auto* path = std::get_if<std::filesystem::path>(&named)) return path->native();
@@ -76,6 +78,8 @@ std::variant<std::filesystem::path, ExitStatus> findStore(const Complaint& compl
   auto configuration = configurationWith(search, complain);
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   auto& directory = std::get<Configuration>(configuration).storage.directory;
+  // Any other directory was named by the configuration. It is not checked here: the error of the
+  // reader names it.
   if (search.isThere || directory != search.directory) return std::move(directory);
   return complain(ExitStatus::kNoService, client::describeTried("store", search.tried), "no-store");
 }
@@ -85,6 +89,7 @@ std::variant<std::filesystem::path, ExitStatus> settingsDirectory(
     const Complaint& complain) {
   if (!named.empty()) {
     std::error_code error;
+    // Fails if the working directory was deleted.
     auto path = std::filesystem::absolute(named, error);
     if (!error) return path;
     return complain(ExitStatus::kBadArguments, "--directory: " + named + ": " + error.message());

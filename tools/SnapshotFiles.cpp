@@ -46,6 +46,8 @@ std::variant<fs::path, ExitStatus> findSnapshot(const std::string& file,
   const auto all = directory.newestFirst();
   if (all.empty()) {
     std::error_code error;
+    // An empty list has two causes: there is no snapshot, or this user may not read the directory.
+    // Opening it again tells them apart.
     const fs::directory_iterator opened(directory.path(), error);
     if (error && error != std::errc::no_such_file_or_directory) {
       return complain(ExitStatus::kNoService, directory.path().native() + ": " + error.message(),

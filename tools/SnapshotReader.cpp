@@ -81,10 +81,13 @@ class Walk {
     if (result != ARCHIVE_OK) return failed(snapshot_, textOf(reader_.get()));
     if (++entries_ > kMostEntries) return failed(snapshot_, "the archive has too many files");
     // Skipping an entry decompresses it too. Test the sizes in the headers before that.
+    // Bounded, so that a size of nearly 2^64 cannot make the sum wrap.
     announced_ += std::min(static_cast<std::uint64_t>(archive_entry_size(entry)), kMostBytes + 1);
     if (announced_ > kMostBytes) return failed(snapshot_, kTooLarge);
     const char* name = archive_entry_pathname(entry);
     const auto type = archive_entry_filetype(entry);
+    // The service packs only files and directories. A link in an archive could lead out of the
+    // directory.
     if (name == nullptr || archive_entry_hardlink(entry) != nullptr ||
         (type != AE_IFREG && type != AE_IFDIR) || leadsOut(name)) {
       return failed(
@@ -98,6 +101,7 @@ class Walk {
   [[nodiscard]] Result<std::string_view> nextPiece() {
     const la_ssize_t count = archive_read_data(reader_.get(), buffer_.data(), buffer_.size());
     if (count < 0) return failed(snapshot_, textOf(reader_.get()));
+    // Counted too, because the size in a header need not be true.
     bytes_ += static_cast<std::uint64_t>(count);
     if (bytes_ > kMostBytes) return failed(snapshot_, kTooLarge);
     return std::string_view(buffer_.data(), static_cast<std::size_t>(count));
@@ -167,6 +171,7 @@ Result<void> check(const fs::path& snapshot, const fs::path& directory, Existing
     struct stat status {};
     const char* name = archive_entry_pathname(entry);
     if (existing == ExistingFiles::kRefuse && archive_entry_filetype(entry) == AE_IFREG &&
+        // lstat(), because a symbolic link counts as existing even if its target is missing.
         ::lstat(name, &status) == 0) {
       return Failure<>{(directory / name).native() + ": the file already exists"};
     }
@@ -242,6 +247,7 @@ Result<std::vector<std::string>> unpackSnapshot(const fs::path& snapshot, const 
   const fs::path source = fs::absolute(snapshot, error);
   if (error) return failed(snapshot, error.message());
   if (::access(source.c_str(), R_OK) != 0) return failed(snapshot, errnoText(errno));
+  // For this user only, like the snapshots themselves.
   const bool isMade = ::mkdir(directory.c_str(), 0700) == 0;
   if (!isMade && errno != EEXIST) return failed(directory, errnoText(errno));
   auto unpacked = unpack(source, directory, existing);

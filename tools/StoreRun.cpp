@@ -28,6 +28,7 @@ std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& r
   const std::filesystem::path path(database);
   std::error_code ignored;
   if (std::filesystem::is_directory(path, ignored)) return path;
+  // The file may be missing: the reader of the store reports that with its own reason.
   if (path.filename() == kDatabaseName) {
     return path.has_parent_path() ? path.parent_path() : std::filesystem::path(".");
   }
@@ -43,7 +44,10 @@ ExitStatus cannotRead(const StoreRun& run, const StoreError& error) {
 
 // Waits for the next records. Returns false when nobody reads the output any more.
 bool waitForRecords(int storeDescriptor, int outputDescriptor) {
+  // The output is polled for errors only: while no records come, a pipe without a reader shows in
+  // no other way.
   std::array<pollfd, 2> polled{{{storeDescriptor, POLLIN, 0}, {outputDescriptor, 0, 0}}};
+  // Only a signal can make it fail here, so it is called again.
   while (poll(polled.data(), polled.size(), -1) < 0) {
   }
   return (polled[1].revents & (POLLERR | POLLHUP | POLLNVAL)) == 0;
@@ -55,6 +59,7 @@ ExitStatus follow(const StoreRun& run, const std::filesystem::path& directory,
   if (const auto error = follower.open(directory, filter)) return cannotRead(run, *error);
   do {
     const auto error = reading.added(follower);
+    // After each batch, so that a reader of the pipe sees records at once.
     run.out << std::flush;
     if (error) return cannotRead(run, *error);
   } while (run.out && waitForRecords(follower.descriptor(), run.outputDescriptor));

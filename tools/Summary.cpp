@@ -138,6 +138,7 @@ std::vector<std::string> newestIn(const fs::path& directory, std::uint64_t count
     if (name) found.emplace_back(name->secondsSince1970, entry->path().string());
   }
   std::ranges::sort(found);
+  // Sorted by the time in the name, not by the file's: copies have other file times.
   if (found.size() > count) found.erase(found.begin(), found.end() - static_cast<long>(count));
   std::vector<std::string> files;
   files.reserve(found.size());

@@ -56,6 +56,7 @@ bool parseTimeOfName(std::string_view text, SummaryName& name) {
   const int hour = number(text.substr(9, 2));
   const int minute = number(text.substr(11, 2));
   const int second = number(text.substr(13, 2));
+  // 60 is a leap second.
   if (!date.ok() || hour > 23 || minute > 59 || second > 60) return false;
   const auto offset = hours(number(text.substr(16, 2))) + minutes(number(text.substr(18, 2)));
   const auto local =
@@ -86,6 +87,7 @@ class SummaryHandler {
     return value([&] { return writer_.Bool(flag); });
   }
   bool RawNumber(const char* text, rapidjson::SizeType length, bool /*copy*/) {
+    // Only at the top of the message: a nested dictionary may have a key of the same name.
     if (depth_ == kInMessage && isTimestamp_) noteTime(std::string(text, length));
     return value([&] { return writer_.RawValue(text, length, rapidjson::kNumberType); });
   }
@@ -95,6 +97,7 @@ class SummaryHandler {
   bool StartObject() {
     if (depth_ == 0) return fail("expected an array of messages");
     if (++depth_ == kInEntry) return beginEntry();
+    // The buffer keeps its memory from message to message.
     if (depth_ == kInMessage) buffer_.Clear(), writer_.Reset(buffer_);
     if (depth_ > kDeepestNesting) return fail("a message is nested too deep");
     return writer_.StartObject();
@@ -215,6 +218,7 @@ std::optional<SummaryName> parseSummaryName(std::string_view name) {
   name.remove_prefix(kTimePattern.size());
   if (!name.starts_with(kMark)) return std::nullopt;
   name.remove_prefix(kMark.size());
+  // The last hyphen: names of services have none, names of applications may.
   const std::size_t hyphen = name.rfind('-');
   if (hyphen == std::string_view::npos) return std::nullopt;
   parsed.application = name.substr(0, hyphen);
@@ -224,6 +228,8 @@ std::optional<SummaryName> parseSummaryName(std::string_view name) {
 
 bool readSummary(const std::string& path, const SummaryMessageHandler& handler,
                  SummaryTotals& totals, std::string& error) {
+  // Numbers as texts keep the digits that the service wrote. Iterative, because a file may be
+  // nested deeper than the stack allows.
   constexpr unsigned kFlags = rapidjson::kParseNumbersAsStringsFlag |
                               rapidjson::kParseIterativeFlag |
                               rapidjson::kParseValidateEncodingFlag;
@@ -234,11 +240,13 @@ bool readSummary(const std::string& path, const SummaryMessageHandler& handler,
   SummaryHandler summary(handler, totals);
   rapidjson::Reader reader;
   const rapidjson::ParseResult result = reader.Parse<kFlags>(stream, summary);
+  // Before the parser's result: to the parser a read error looks like the end of the file.
   if (std::ferror(file.get()) != 0) {
     error = "cannot be read";
     return false;
   }
   if (!result.IsError()) return true;
+  // Opened again, because the place of an error is counted from the beginning.
   std::ifstream text(path, std::ios::binary);
   error = "is not a summary: " +
           describeJsonError(text, result.Offset(), result.Code(), summary.problem());

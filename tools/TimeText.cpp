@@ -131,6 +131,7 @@ std::optional<double> parseCalendarTime(std::string_view text) {
                           cursor.isAtEnd();
   if (!isComplete) return std::nullopt;
   const int day = time.fields.tm_mday;
+  // The C library finds out whether it is summer time at that moment.
   time.fields.tm_isdst = -1;
   const std::time_t seconds =
       time.offset ? timegm(&time.fields) - *time.offset : mktime(&time.fields);
@@ -168,6 +169,7 @@ double midnight(double now, int daysBefore) {
   const auto seconds = static_cast<std::time_t>(std::floor(now));
   std::tm fields{};
   if (localtime_r(&seconds, &fields) == nullptr) return now;
+  // mktime() accepts a day of 0 or less and goes back to the month before.
   fields.tm_mday -= daysBefore;
   fields.tm_hour = fields.tm_min = fields.tm_sec = 0;
   fields.tm_isdst = -1;
@@ -194,6 +196,8 @@ Parsed<double> parseTime(std::string_view text, double now) {
 
 std::string localTime(double seconds) {
   const double whole = std::floor(seconds);
+  // Rounded down: a time that was rounded up would lie after its record, and --since with it would
+  // skip the record.
   const auto milliseconds = static_cast<int>((seconds - whole) * 1000);
   const auto time = static_cast<std::time_t>(whole);
   std::tm fields{};

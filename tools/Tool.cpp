@@ -20,6 +20,7 @@ ExitStatus runTool(std::vector<std::string> arguments, const ToolStreams& stream
   } else {
     status = std::get<Command>(parsed).run(streams);
   }
+  // A full disk may show only here, after everything was printed.
   if (!streams.output.flush()) {
     streams.errors << "halvoxctl: the output cannot be written\n";
     return status == ExitStatus::kDone ? ExitStatus::kCannotWrite : status;

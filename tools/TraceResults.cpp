@@ -79,6 +79,7 @@ std::variant<TraceResults, std::string> readTraceResults(const std::string& file
   document.ParseStream<kFlags>(input);
   if (document.HasParseError() || !document.IsObject()) return std::string(kNoResults);
   const auto has = [&](const char* name) { return document.HasMember(name); };
+  // Another file of JSON must not pass for results: all that the service writes is required.
   if (!has("product") || !document["product"].IsString() || !has("unit") ||
       !document["unit"].IsString() || textOf(document["unit"]) != "ns" || !has("values") ||
       !document["values"].IsObject()) {
@@ -101,6 +102,7 @@ std::variant<TraceResults, std::string> readTraceResults(const std::string& file
 TraceStatistics statisticsOf(std::vector<double> values) {
   std::ranges::sort(values);
   const auto atRank = [&](double share) {
+    // The nearest-rank method: every figure is a value that was measured.
     const auto rank = static_cast<std::size_t>(std::ceil(share * double(values.size())));
     return values[std::max<std::size_t>(rank, 1) - 1];
   };

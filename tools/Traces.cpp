@@ -44,6 +44,7 @@ constexpr std::uint32_t kLastCode = 0x2104408A;
 constexpr std::chrono::minutes kStopWithin{10};
 // The service ends a tracer that does not answer within ten seconds. Wait longer than that.
 constexpr std::chrono::seconds kRecordsWithin{15};
+// Nothing announces that a recording has begun, so its directory is polled.
 constexpr std::chrono::milliseconds kLookEvery{5};
 
 using platform::Dictionary;
@@ -168,6 +169,7 @@ bool recordsSoon(const fs::path& storage, const Names& before) {
   const auto deadline = std::chrono::steady_clock::now() + kRecordsWithin;
   while (std::chrono::steady_clock::now() < deadline) {
     const auto now = recordings(storage);
+    // A user who may not see the recordings cannot wait for one: the program runs at once.
     if (!now.has_value() || !std::ranges::includes(before, *now)) return true;
     std::this_thread::sleep_for(kLookEvery);
   }
@@ -268,11 +270,13 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
     isUsable ? complain.warn(text) : static_cast<void>(complain(ExitStatus::kBadArguments, text));
   }
   if (!isUsable) return ExitStatus::kBadArguments;
+  // Taken before the session exists: results that an earlier trace left must not be shown as new.
   const auto before = identityOf(results);
   const auto socket = namedSocket(options, complain);
   if (const auto* status = std::get_if<ExitStatus>(&socket)) return *status;
   auto opened = client::HalvoxConnection::open(
       std::get<std::string>(socket),
+      // Longer than --timeout: the answer to the stop waits for the evaluation of the trace.
       std::max<std::chrono::milliseconds>(options.timeout, kStopWithin));
   if (!opened) return complain(ExitStatus::kNoService, opened.failure->message);
   const fs::path& storage = configuration.storage.directory;
@@ -285,6 +289,7 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
     return complain(ExitStatus::kRefused,
                     "the service does not record; see its log for the reason");
   }
+  // The session is stopped even if the program fails, so that its trace ends and is shown.
   const std::string ofProgram = runProgram(request.command);
   if (const std::string failure = session.stop(); !failure.empty()) {
     return complain(ExitStatus::kRefused, failure);
