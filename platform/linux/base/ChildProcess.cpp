@@ -37,6 +37,7 @@ class DescriptorSources {
 
  private:
   int sourceOf(int ours) {
+    // Above all numbers of the child's, so nothing can replace it.
     if (ours == ChildProgram::Descriptor::kNull || ours > largest_) return ours;
     UniqueFd& copy = copies_.emplace_back(::fcntl(ours, F_DUPFD_CLOEXEC, largest_ + 1));
     if (!copy) error_ = errno;
@@ -61,6 +62,7 @@ class SpawnActions {
       }
     }
     if (program.otherDescriptors == ChildProgram::OtherDescriptors::kClosed) {
+      // The last action: the sources of the child's descriptors are above that number too.
       ::posix_spawn_file_actions_addclosefrom_np(&actions_, sources.largest() + 1);
     }
   }
@@ -83,6 +85,7 @@ class SpawnAttributes {
       ::sigemptyset(&signals);
       for (const int signal : program.blockedSignals) ::sigaddset(&signals, signal);
       ::posix_spawnattr_setsigmask(&attributes_, &signals);
+      // A signal that we ignore would be ignored by the child as well.
       ::sigfillset(&signals);
       ::posix_spawnattr_setsigdefault(&attributes_, &signals);
       flags |= POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF;
@@ -181,10 +184,12 @@ ChildProcess& ChildProcess::operator=(ChildProcess&& other) noexcept {
 }
 
 void ChildProcess::signal(int number) const {
+  // Only a child that has not been reaped: afterwards its ID may be that of another process.
   if (pid_ != 0) ::kill(pid_, number);
 }
 
 void ChildProcess::signalGroup(int number) const {
+  // A child in our group is signalled alone. The group includes this process.
   if (pid_ != 0) ::kill(group_ == ChildProgram::Group::kOurs ? pid_ : -pid_, number);
 }
 
@@ -211,6 +216,8 @@ std::optional<ChildEnd> ChildProcess::waitUntil(Clock::time_point deadline) {
   while (!reap(WNOHANG)) {
     const int left = millisecondsUntil(deadline);
     if (left == 0) return std::nullopt;
+    // A pidfd becomes readable when its process ends. Without one, poll() ignores the negative
+    // number and serves as a pause.
     pollfd polled{.fd = descriptor_.get(), .events = POLLIN, .revents = 0};
     ::poll(&polled, 1, descriptor_ ? left : std::min(left, kLookEvery));
   }

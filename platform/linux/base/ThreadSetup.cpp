@@ -36,18 +36,24 @@ sigset_t blockAllSignals() {
 }  // namespace
 
 void setUpThread(std::string_view label) {
+  // The kernel's limit; a longer name is refused as a whole. The end of a label says more than its
+  // start, which all queues share.
   constexpr std::size_t kLongestName = 15;
   while (label.size() > kLongestName) {
     const std::size_t dot = label.find('.');
     label.remove_prefix(dot == std::string_view::npos ? label.size() - kLongestName : dot + 1);
   }
   ::pthread_setname_np(::pthread_self(), std::string(label).c_str());
+  // The loop of the connections reads the signals from a descriptor. A thread that does not block
+  // them could be chosen to handle them.
   blockAllSignals();
 }
 
 void setUpThread(std::string_view label, ThreadPriority priority) {
   constexpr int kLowestPriority = 19;
   setUpThread(label);
+  // Relative to the main thread, because the whole service may have been started at a lower
+  // priority.
   const int steps = stepsBelowMainThread(priority);
   if (steps == 0) return;
   // On Linux the ID of a process is that of its main thread, and each thread has its own niceness.

@@ -52,6 +52,7 @@ bool isToBeOpened(const FileToRead& file, FileContent& content) {
 }
 
 void readAll(int descriptor, const FileToRead& file, FileContent& content) {
+  // Only a hint: files of /proc have the size 0, and a file may grow while it is read.
   content.bytes.reserve(std::min<std::uint64_t>(content.size, file.most));
   std::array<char, kPieceSize> piece;
   while (true) {
@@ -91,6 +92,7 @@ FileContent readWholeFile(const FileToRead& file) {
     return content;
   }
   if (!accept(file, status, content)) return content;
+  // A pipe may be read after all. Its reader has to wait for what the writer sends.
   if (file.kinds == FileToRead::Kinds::kAny) ::fcntl(descriptor.get(), F_SETFL, 0);
   readAll(descriptor.get(), file, content);
   return content;

@@ -19,6 +19,7 @@ AsioDispatchService::AsioDispatchService(LogService& log, StatisticsService& sta
       runner_(std::make_shared<JobRunner>(log, statistics)),
       pool_(std::make_shared<DispatchPool>(runner_, statistics)) {}
 
+// A year stands for no limit. The time at which it ends can still be computed.
 AsioDispatchService::~AsioDispatchService() { stop(std::chrono::hours(24 * 365)); }
 
 std::shared_ptr<DispatchQueue> AsioDispatchService::createSerialQueue(std::string_view label,
@@ -57,6 +58,7 @@ bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
   {
     const MutexLock lock(mutex_);
     isStopped_ = true;
+    // A copy: waiting for them under the lock would block a job that makes a queue, for ever.
     queues = ownThreadQueues_;
   }
   for (const auto& queue : queues) queue->stop();
@@ -71,6 +73,7 @@ bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
     logStuck(stuck);
     return false;
   }
+  // Not when a job still runs: it may use what the discarded jobs hold.
   pool_->discardJobs();
   const MutexLock lock(mutex_);
   ownThreadQueues_.clear();

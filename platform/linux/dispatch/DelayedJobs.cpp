@@ -44,6 +44,7 @@ DelayedJobs::Ticket DelayedJobs::add(std::chrono::nanoseconds delay, QualityOfSe
     return ticket;
   }
   jobs_.emplace(ticket, Delayed{quality, std::move(job)});
+  // Only for a new earliest job. The timer is set once and not for each job.
   if (!armedFor_.has_value() || due < *armedFor_) arm();
   return ticket;
 }
@@ -55,6 +56,8 @@ void DelayedJobs::cancel(const Ticket& ticket) {
   if (place == jobs_.end()) return;
   cancelled = std::move(place->second);
   jobs_.erase(place);
+  // A timer that nobody needs would wake the idle service: that of a wait that ended early once
+  // did, nine seconds after each start of a session.
   if (jobs_.empty() || (armedFor_.has_value() && jobs_.begin()->first.first > *armedFor_)) arm();
 }
 
@@ -99,6 +102,7 @@ void DelayedJobs::onTimer() {
     const Time now = std::chrono::steady_clock::now();
     while (!jobs_.empty() && jobs_.begin()->first.first <= now) {
       auto node = jobs_.extract(jobs_.begin());
+      // The job runs on a thread of its own quality. This thread only watches the timer.
       asio::post(pool_.context(node.mapped().quality),
                  [this, job = std::move(node.mapped().job)] { runDue(job); });
     }
@@ -113,6 +117,7 @@ void DelayedJobs::runDue(const Job& job) {
     const MutexLock lock(mutex_);
     isStopped = isStopped_;
   }
+  // The job was posted before the stop, but its turn came after it.
   if (isStopped) return pool_.runner().countDiscarded(1);
   const DispatchThread::Working working(nullptr, "delayed");
   pool_.runner().run(job);

@@ -7,6 +7,7 @@ namespace halvox::platform::linux_ {
 
 DispatchPool::DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService& statistics)
     : runner_(std::move(runner)), labels_(statistics) {
+  // The others are made when they are needed; these watch the timer from the start.
   if (!utility_.provide()) {
     throw std::system_error(std::make_error_code(std::errc::resource_unavailable_try_again),
                             "cannot start the threads of the queues");
@@ -34,6 +35,7 @@ asio::io_context& DispatchPool::context(QualityOfService quality) {
 }
 
 void DispatchPool::waitUntilIdle(std::chrono::steady_clock::time_point deadline) {
+  // Before the first look at turns_: from here on, the last turn to end reports it.
   isAwaited_.store(true);
   const MutexLock lock(mutex_);
   while (turns_.load() > 0 && idle_.waitUntil(mutex_, deadline)) {
@@ -47,6 +49,8 @@ void DispatchPool::reportIdle() {
 
 void DispatchPool::stop() {
   isStopped_.store(true, std::memory_order_relaxed);
+  // Waits before timers and timers before threads: each could otherwise still hand work to the
+  // next.
   waits_.stop();
   delayedJobs_.stop();
   for (PoolThreads* const threads : {&urgent_, &utility_, &background_}) threads->stop();

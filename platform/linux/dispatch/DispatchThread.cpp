@@ -21,6 +21,7 @@ DispatchThread& DispatchThread::current() {
 }
 
 DispatchThread::~DispatchThread() {
+  // In this order, because helped jobs may add turns.
   endHelping();
   wakePool();
 }
@@ -33,6 +34,7 @@ void DispatchThread::endHelping() {
     left -= queue->help(*this, left);
   }
   queuesToHelp_.clear();
+  // After the loop: queues to which helped jobs add brief jobs are helped in it too.
   isHelping_ = false;
 }
 

@@ -24,12 +24,14 @@ void DispatchWaits::begin(std::shared_ptr<SharedQueue> queue,
     const MutexLock lock(mutex_);
     outcome = tryEnd(semaphore, timeout, wait);
   }
+  // Outside the lock: resume() takes the queue's, and one lock at a time leaves no order to keep.
   if (outcome.has_value()) resume(std::move(wait), *outcome);
 }
 
 std::optional<WaitOutcome> DispatchWaits::tryEnd(const std::shared_ptr<SharedSemaphore>& semaphore,
                                                  std::optional<std::chrono::nanoseconds> timeout,
                                                  Wait& wait) {
+  // A signal that was kept wins over a time-out of zero: the wait has what it waits for.
   if (!isStopped_ && semaphore->signals_ > 0) {
     --semaphore->signals_;
     return WaitOutcome::kSignalled;
@@ -37,6 +39,7 @@ std::optional<WaitOutcome> DispatchWaits::tryEnd(const std::shared_ptr<SharedSem
   if (!isStopped_ && timeout.has_value() && timeout->count() <= 0) return WaitOutcome::kTimedOut;
   const std::uint64_t number = begun_++;
   if (!isStopped_ && timeout.has_value()) {
+    // Weak: the wait keeps its semaphore alive. The time-out of a wait that has ended must not.
     wait.timeout = delayedJobs_.add(*timeout, QualityOfService::kUtility,
                                     [this, weakSemaphore = std::weak_ptr(semaphore), number] {
                                       timeOut(weakSemaphore, number);
@@ -114,6 +117,8 @@ void DispatchWaits::discard() {
       semaphore->waits_.clear();
     }
   }
+  // Outside the lock, like the end of `semaphores`: what they hold may signal while it is
+  // destroyed.
   runner_.countDiscarded(discarded.size());
   for (const Wait& wait : discarded) wait.queue->discardJobs();
 }

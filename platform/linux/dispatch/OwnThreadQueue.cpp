@@ -44,7 +44,9 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
     }
     waiting_.push_back({std::move(job), weight});
     if (hasWorker_) return;  // the worker looks for new jobs before it ends its work
+    // The helper has noted this queue already and will find the job.
     if (mayHelp && helper_ == &helper) return;
+    // One helper at a time. For a job of a second thread, the own thread is woken.
     isNewForHelper = mayHelp && helper_ == nullptr;
     if (isNewForHelper) {
       helper_ = &helper;
@@ -52,6 +54,7 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
       mustWake = takeWakeUp();
     }
   }
+  // Both after the lock is released: a thread that wakes up needs it at once.
   if (isNewForHelper) helper.noteQueueToHelp(shared_from_this());
   if (mustWake) wakeUp_.notifyOne();
 }
@@ -74,6 +77,7 @@ void OwnThreadQueue::stop() {
     const MutexLock lock(mutex_);
     life_ = Life::kStopped;
     isStopped_.store(true, std::memory_order_relaxed);
+    // Destroyed after the lock is released: what a job holds may add jobs to this queue.
     discarded.swap(waiting_);
     wakeUp_.notifyOne();
   }
@@ -107,6 +111,8 @@ void OwnThreadQueue::work(DispatchThread& thread) {
     while (takeBatch()) {
       mutex_.unlock();
       while (canGoOn()) runNextInBatch(thread);
+      // At the end of each batch: this thread may sleep now, and the turns that it holds back with
+      // it.
       thread.wakePool();
       mutex_.lock();
     }
@@ -137,6 +143,7 @@ void OwnThreadQueue::end() {
 // Waits until there are jobs and no other worker. False when the thread should end.
 bool OwnThreadQueue::waitForWork() {
   while (hasWorker_ || !hasWork()) {
+    // Not while a helper works. It wakes this thread when it is done.
     if (!hasWorker_ && life_ != Life::kOpen) return false;
     sleeps_ = true;
     wakeUp_.wait(mutex_);
@@ -151,6 +158,7 @@ std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit
   bool mustWake = false;
   {
     const MutexLock lock(mutex_);
+    // First: jobs that are added from now on must note the queue again or wake its thread.
     if (helper_ == &helper) helper_ = nullptr;
     if (hasWorker_ || !hasWork()) return 0;
     hasWorker_ = true;
@@ -162,9 +170,11 @@ std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit
         ++done;
       }
       mutex_.lock();
+      // If jobs of this batch are left, those that were added meanwhile must wait for them.
       isFront = next_ == batch_.size();
     }
     hasWorker_ = false;
+    // Also without work after close() or stop(): the own thread has waited for this to end.
     mustWake = (hasWork() || life_ != Life::kOpen) && takeWakeUp();
   }
   if (mustWake) wakeUp_.notifyOne();
@@ -182,6 +192,7 @@ bool OwnThreadQueue::takeBatch() {
   if (next_ < batch_.size()) return true;
   batch_.clear();
   next_ = 0;
+  // Before the swap: the emptied vector is the one to which jobs are added next.
   if (batch_.capacity() > kKeptCapacity) batch_.shrink_to_fit();
   batch_.swap(waiting_);
   return true;

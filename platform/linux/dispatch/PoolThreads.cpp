@@ -38,6 +38,7 @@ bool PoolThreads::provide() {
   } catch (const std::system_error&) {
     if (threads_.empty()) return false;
   }
+  // With one thread as well: a second one is not tried again for each job.
   areThere_.store(true, std::memory_order_relaxed);
   return true;
 }
@@ -63,13 +64,16 @@ void PoolThreads::join() {
   std::vector<std::thread> threads;
   {
     const MutexLock lock(mutex_);
+    // Joined after the lock is released: a thread takes it as its last step.
     threads.swap(threads_);
   }
   for (std::thread& thread : threads) thread.join();
 }
 
 void PoolThreads::discardJobs() {
+  // Without work to wait for, poll() returns when the run queue is empty.
   work_.reset();
+  // A context that was stopped runs nothing.
   context_.restart();
   context_.poll();
 }

@@ -38,6 +38,8 @@ void SharedQueue::async(JobWeight /*weight*/, Job job) {
     label_.added.add();
     if (hasTurn_ || isWaiting_) return;
     hasTurn_ = true;
+    // Under the lock: a pool that is asked whether it is idle must count this job's turn from now
+    // on.
     pool_->beginTurn();
   }
   askForTurn();
@@ -55,12 +57,14 @@ void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
     if (isWaiting_) throw std::logic_error("a job called waitOn() a second time");
     isWaiting_ = true;
   }
+  // Without the lock: a signal that is kept ends the wait at once, and resume() takes the lock.
   pool_->waits().begin(shared_from_this(), shared, timeout, std::move(then));
 }
 
 void SharedQueue::resume(Job then) {
   {
     const MutexLock lock(mutex_);
+    // In front: what follows the wait comes before the jobs that were added during it.
     jobs_.push_front(std::move(then));
     label_.added.add();
     isWaiting_ = false;
@@ -74,7 +78,9 @@ void SharedQueue::resume(Job then) {
 
 void SharedQueue::askForTurn() {
   DispatchThread& thread = DispatchThread::current();
+  // A thread of the pool that is woken for each message costs more than the rest of the message.
   if (thread.isHoldingPool()) return thread.noteTurn(shared_from_this());
+  // Back to the end of the run queue, although jobs are left: other queues wait for this thread.
   beginTurn();
 }
 
@@ -107,6 +113,7 @@ bool SharedQueue::runNext() {
     jobs_.pop_front();
   }
   pool_->runner().run(job);
+  // After the job: a queue that is stuck in one has more jobs added than run.
   label_.run.add();
   return true;
 }
@@ -117,6 +124,7 @@ void SharedQueue::discardJobs() {
     const MutexLock lock(mutex_);
     if (hasTurn_) pool_->endTurn();
     hasTurn_ = false;
+    // Destroyed after the lock is released: what a job holds may add jobs to this queue.
     discarded.swap(jobs_);
   }
   if (!discarded.empty()) pool_->runner().countDiscarded(discarded.size());
