@@ -34,6 +34,7 @@ AnalyticsRecords::AnalyticsRecords(EventNames& names, WriterQueue& queue,
       longestPayload_(longestPayload) {}
 
 void AnalyticsRecords::add(double time, std::string_view name, AnalyticsPayloadBuilder builder) {
+  // Outside the queue's lock, which all senders share: the name is looked up without a lock.
   Event event{time, names_.find(name), nullptr, std::move(builder)};
   if (event.name == nullptr) {
     event.ownName = std::make_unique<EventName>(name, true);
@@ -47,12 +48,14 @@ void AnalyticsRecords::add(double time, std::string_view name, AnalyticsPayloadB
 
 void AnalyticsRecords::takeQueued() {
   taken_.clear();
+  // Before the swap: the emptied vector is the one to which events are added next.
   if (taken_.capacity() > kKeptEvents) taken_ = std::vector<Event>();
   taken_.swap(queued_);
   next_ = 0;
 }
 
 SqliteCode AnalyticsRecords::prepare(Database& database) {
+  // Another database may have come in the place of the last, with other numbers for the names.
   ++generation_;
   const SqliteCode code = spans_.prepare(database);
   if (code != SQLITE_OK) return code;
@@ -92,10 +95,13 @@ SqliteCode AnalyticsRecords::writeNext(TransactionAllowance& allowance) {
       std::exchange(hasLookedAhead_, false) ? std::exchange(lookedAhead_, {}) : build(index);
   const Event* twin = nullptr;
   if (index + 1 < taken_.size()) {
+    // The next payload is built before this one is encoded: comparing two values is cheaper than
+    // encoding both and comparing texts.
     lookedAhead_ = build(index + 1);
     hasLookedAhead_ = true;
     if (encodeAlike(payload, lookedAhead_)) twin = &taken_[index + 1];
   }
+  // The payload that was built ahead is kept for the next record unless this one has used it.
   if (twin != nullptr) hasLookedAhead_ = false;
   const std::uint64_t events = twin != nullptr ? 2 : 1;
   const std::string_view text = encoder_.encode(payload);
@@ -105,6 +111,8 @@ SqliteCode AnalyticsRecords::writeNext(TransactionAllowance& allowance) {
   writtenBytes_ += text.size();
   allowance.records -= static_cast<std::int64_t>(events);
   allowance.payloadBytes -= static_cast<std::int64_t>(text.size());
+  // The record is counted as written although it is not stored: the queue must know that it is
+  // gone.
   if (text.size() > longestPayload_) {
     tooLarge_ += events;
     return SQLITE_OK;
@@ -139,8 +147,10 @@ SqliteCode AnalyticsRecords::insert(const Event& event, const Event* twin,
 }
 
 SqliteCode AnalyticsRecords::identify(EventName& name) {
+  // The usual case: the same names come again and again.
   if (name.generation == generation_) return SQLITE_OK;
   statements_.insertName.bind(1, name.text);
+  // Inserted first and looked up afterwards: the name may be in the database from an earlier run.
   SqliteCode code = statements_.insertName.run();
   if (code != SQLITE_OK) return code;
   statements_.findName.bind(1, name.text);
@@ -173,6 +183,7 @@ void AnalyticsRecords::endTransaction(FinishedRecords& finished) {
 
 std::uint64_t AnalyticsRecords::dropTaken(DropReason reason, FinishedRecords& finished) {
   spans_.onRolledBack();
+  // The rollback has removed the rows of names that were new in this transaction.
   ++generation_;
   hasLookedAhead_ = false;
   lookedAhead_ = {};

@@ -68,6 +68,7 @@ TextKind classify(std::string_view text) {
 std::string_view dateText(double secondsSince1970, std::span<char, 64> buffer) {
   using namespace std::chrono;
   // A date just before the end would be rounded up to the year 10000.
+  // Rounded, because a fraction such as .1 is often a little less as a double.
   const auto rounded = microseconds{std::llround(secondsSince1970 * 1e6)};
   const sys_time<microseconds> time{
       std::min(rounded, duration_cast<microseconds>(duration<double>(kEnd)) - microseconds(1))};
@@ -156,6 +157,7 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
   Text() { Reset(buffer_); }
 
   std::string_view write(const Dictionary& payload) {
+    // One large payload must not hold its memory for the life of the service.
     if (buffer_.stack_.GetCapacity() > kKeptBufferBytes) buffer_ = rapidjson::StringBuffer();
     buffer_.Clear();
     Reset(buffer_);
@@ -206,6 +208,8 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
       case TextKind::kEscapesNeeded:
         return addEscaped(text);
       case TextKind::kNotAscii:
+        // Texts that came from files or other processes may be anything. RapidJSON would copy their
+        // bytes, and readers would refuse the whole payload.
         return addEscaped(replaceInvalidUtf8(text));
     }
   }
@@ -247,6 +251,8 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
 
   template <typename Real>
   void addReal(Real number) {
+    // JSON has no such numbers. RapidJSON's writer would refuse them and leave the object
+    // incomplete.
     if (std::isnan(number)) return addPlain("NaN");
     if (std::isinf(number)) return addPlain(number > 0 ? "Infinity" : "-Infinity");
     addDecimal(number);
@@ -262,6 +268,7 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
 
   void addDate(Date date) {
     const double seconds = date.secondsSince1970;
+    // Negated, so that NaN is not taken for a date.
     if (!(seconds >= kEarliest && seconds < kEnd)) return addReal(seconds);
     std::array<char, 64> buffer;
     addPlain(dateText(seconds, buffer));

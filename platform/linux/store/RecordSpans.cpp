@@ -81,6 +81,7 @@ SqliteCode RecordSpans::note(double time) {
     span_.lastTime = std::max(span_.lastTime, time);
     return SQLITE_OK;
   }
+  // The first record of the next span: the times of the last one are complete.
   const SqliteCode code = flush();
   span_ = {number, time, time};
   return code;
@@ -120,6 +121,7 @@ SqliteCode RecordSpans::deleteOldest(bool& found) {
   statements_.deleteRecords.bind(2, first + kRecordsPerStep - 1);
   code = statements_.deleteRecords.run();
   if (code != SQLITE_OK) return code;
+  // Only spans of which no number is left, so the one that was begun stays.
   statements_.deleteEmptySpans.bind(1, (first + kRecordsPerStep) / kRecordsPerSpan);
   return statements_.deleteEmptySpans.run();
 }

@@ -57,6 +57,7 @@ SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
 }  // namespace
 
 SqliteCode Retention::prepare(Database& database) {
+  // Not the constant of the opening: a database that others made has pages of its own size.
   pageBytes_ = static_cast<std::uint64_t>(database.queryInteger("PRAGMA page_size").value_or(0));
   // Vacuum writes each page that it moves to the log. Move so few at a time that the log does not
   // outgrow its limit.
@@ -84,6 +85,7 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
   const bool byAge = std::chrono::steady_clock::now() >= nextByAge_;
   SqliteCode code = readUse();
   if (code != SQLITE_OK) return code;
+  // The usual case. This runs after every transaction, so it must not begin one of its own.
   if (!byAge && !isFull() && fileBytes() <= limits_.databaseBytes) return SQLITE_OK;
 
   const std::uint64_t before = fileBytes();
@@ -99,6 +101,7 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
   }
   // The file becomes shorter only when the log is copied into it.
   const bool hasShrunk = fileBytes() < before;
+  // Once, at the end of a series of steps.
   return hasShrunk && !more ? statements_.checkpoint.run() : SQLITE_OK;
 }
 
@@ -123,6 +126,7 @@ SqliteCode Retention::deleteAged(double now, std::span<RecordKind* const> kinds,
     });
     if (code != SQLITE_OK) return code;
     if (!found) {
+      // Only when nothing was left to delete. Otherwise the next round goes on at once.
       nextByAge_ = std::chrono::steady_clock::now() + kAgeInterval;
       return SQLITE_OK;
     }
@@ -134,6 +138,7 @@ SqliteCode Retention::deleteAged(double now, std::span<RecordKind* const> kinds,
 SqliteCode Retention::deleteForSize(std::span<RecordKind* const> kinds, bool& more) {
   for (int step = 0; step < kSizeSteps; ++step) {
     SqliteCode code = readUse();
+    // Measured again after each step: the records that it deletes may be large or small.
     if (code != SQLITE_OK || !isFull()) return code;
     bool found = false;
     code = deleteOldest(kinds, found);

@@ -52,6 +52,8 @@ SqliteCode SimpleRecordKind::writeNext(TransactionAllowance& allowance) {
   writtenBytes_ += bound.bytes;
   --allowance.records;
   allowance.payloadBytes -= static_cast<std::int64_t>(bound.bytes);
+  // The record is counted as written although it is not stored: the queue must know that it is
+  // gone.
   if (bound.bytes > longestPayload_) {
     ++tooLarge_;
     return SQLITE_OK;

@@ -70,12 +70,14 @@ void SqliteStore::close() {
 
 void SqliteStore::run() {
   setUpThread("halvox-store");
+  // Records may have expired since the last run, and none may come for a long time.
   maintainWhileIdle();
   const auto takeAll = [this] {
     for (RecordKind* const kind : kinds_) kind->takeQueued();
   };
   while (queue_.take(nextRound_, takeAll)) {
     nextRound_ = std::chrono::steady_clock::now() + queue_.limits().gatherTime;
+    // Before the records are written, which then go into the new database.
     if (const auto finding = check_.finding()) replaceDamaged(*finding);
     writeTaken();
     maintainWhileIdle();
@@ -102,6 +104,7 @@ bool SqliteStore::hasTaken() const {
 // Opens the database if it is not open, or if its path now leads to another file or to none:
 // records in a file without a name would be lost. Returns false after dropping the taken records.
 bool SqliteStore::makeReady() {
+  // One stat() for each transaction: SQLite does not notice that its file has lost its name.
   if (database_.isOpen() && files_.identity() == identity_) return logHasRoom();
   if (database_.isOpen()) {
     kLog.error(files_.database().c_str(),
@@ -136,9 +139,11 @@ bool SqliteStore::logHasRoom() {
 std::optional<StoreError> SqliteStore::openDatabase() {
   // An orderly close removes the log. One that exists was left by a run that was killed, or that
   // ended before it had checked the database.
+  // Before the database is opened, which makes a log.
   bool mustCheck = files_.logBytes() > 0;
   if (auto error = openStoreDatabase(files_, sizes_, database_)) return error;
   SqliteCode code = useDatabase();
+  // Reading the newest records may already have found what the check would look for.
   if (meansDamage(code)) {
     mustCheck = false;
     std::string newName;
@@ -179,6 +184,7 @@ std::optional<StoreError> SqliteStore::beginAnew(const std::string& finding, std
 // Begins a new database. Copies the records of this run, which are newer than `extent_`, into it.
 // Those of earlier runs are only in the renamed file.
 void SqliteStore::replaceDamaged(const std::string& finding) {
+  // A copy, because useDatabase() below reads that of the new database.
   const StoreExtent extent = extent_;
   std::string newName;
   if (const auto error = beginAnew(finding, newName)) return kLog.error("", error->description);
@@ -189,10 +195,13 @@ void SqliteStore::replaceDamaged(const std::string& finding) {
     kLog.error("cannot copy all records that were stored since the start; the others are only in ",
                newName, ": ", problem);
   }
+  // After the copy, so that numbering continues after the copied records.
   if (useDatabase() != SQLITE_OK) kLog.error("", cannotRead().description);
 }
 
 SqliteCode SqliteStore::prepareStatements() {
+  // IMMEDIATE takes the lock for writing now. A file that another process has locked is then
+  // noticed before payloads are built and encoded.
   SqliteCode code = database_.prepare("BEGIN IMMEDIATE", begin_);
   if (code == SQLITE_OK) code = database_.prepare("COMMIT", commit_);
   if (code == SQLITE_OK) code = retention_.prepare(database_);
@@ -205,6 +214,7 @@ SqliteCode SqliteStore::prepareStatements() {
 SqliteCode SqliteStore::writeTransaction() {
   TransactionAllowance allowance{kRecordsPerTransaction,
                                  static_cast<std::int64_t>(sizes_.transactionBytes)};
+  // fail() reads it when SQLite itself has no error of the system to give.
   errno = 0;
   SqliteCode code = begin_.run();
   for (RecordKind* const kind : kinds_) {

@@ -98,6 +98,7 @@ void StoreCheck::run(const std::string& file, const StoreExtent& extent, const O
   std::string what;
   Outcome outcome = Outcome::kUnreadable;
   if (database.open(file, DatabaseAccess::kReadOnly) == SQLITE_OK) {
+    // The writer may hold a lock for a moment. Damage and a lock must not be confused.
     sqlite3_busy_timeout(database.get(), static_cast<int>(kBusyTimeout.count()));
     outcome = readAll(database, extent, what);
   } else {
@@ -161,10 +162,14 @@ StoreCheck::Outcome StoreCheck::readTable(Database& database, const std::string&
   std::int64_t last = std::numeric_limits<std::int64_t>::min();
   while (code == SQLITE_ROW) {
     const auto begun = Clock::now();
+    // Each slice is a new query that continues after the last row: the transaction of the last one
+    // has ended, and retention may have deleted rows since.
     rows.bind(1, last);
     rows.bind(2, newest);
     code = readSlice(rows, last, records_);
+    // Before the reset, which may replace the error.
     if (code != SQLITE_ROW && code != SQLITE_DONE) what = table + ": " + database.errorText();
+    // Ends the transaction before the pause.
     rows.reset();
     if (!pause(Clock::now() - begun)) return Outcome::kStopped;
   }
@@ -173,6 +178,7 @@ StoreCheck::Outcome StoreCheck::readTable(Database& database, const std::string&
 }
 
 bool StoreCheck::pause(Clock::duration length) {
+  // As long as the slice took: on a busy disk, the check takes at most half of its time.
   const auto until = Clock::now() + std::max<Clock::duration>(length, kShortestPause);
   const MutexLock lock(mutex_);
   while (!isStopping_ && stopping_.waitUntil(mutex_, until)) {

@@ -16,6 +16,8 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::string_view kLockFileName = "halvox.lock";
+// The database, its write-ahead log and the index of the log. They are renamed together: SQLite
+// would copy a log into whatever database has its name.
 constexpr std::array<std::string_view, 3> kSuffixes{"", "-wal", "-shm"};
 constexpr mode_t kFileMode = 0640;
 // The time in a name has a resolution of one second; a number distinguishes equal times. This bound
@@ -91,10 +93,12 @@ std::optional<StoreError> StoreFiles::claimDirectory() {
 }
 
 std::optional<StoreError> StoreFiles::makeDatabaseFile() {
+  // The log of a database that was removed must not be applied to the new one.
   if (sizeOf(database_) == 0 && logBytes() > 0) {
     std::string newName;
     if (auto error = setAside(newName)) return error;
   }
+  // SQLite would make it readable for everybody. It gives its log the mode of the database.
   const UniqueFd made(::open(database_.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, kFileMode));
   if (made || errno == EEXIST) return std::nullopt;
   return failure(StoreError::Kind::kDirectory, database_, "cannot create the database file", errno);

@@ -56,6 +56,7 @@ std::string pragmas(const StoreSizes& sizes) {
          std::to_string(sizes.logBytes / kPageBytes) +
          "; PRAGMA journal_size_limit = " + std::to_string(sizes.logBytes) +
          "; PRAGMA cache_size = -" + std::to_string(kCacheKibibytes) +
+         // Debian builds SQLite with secure_delete on, which overwrites deleted records with zeros.
          "; PRAGMA secure_delete = OFF; PRAGMA temp_store = MEMORY";
 }
 
@@ -63,7 +64,10 @@ std::string pragmas(const StoreSizes& sizes) {
 Attempt examine(const StoreFiles& files, Database& database) {
   SqliteCode code = database.open(files.database(), DatabaseAccess::kReadWrite);
   if (code != SQLITE_OK) return judged(code, files, database);
+  // Before the first statement: another program may hold a lock while the service starts.
   sqlite3_busy_timeout(database.get(), static_cast<int>(kBusyTimeout.count()));
+  // Reads the first page. A file that is not a database is found out here, before anything changes
+  // it.
   code = database.execute("PRAGMA schema_version");
   if (code != SQLITE_OK) return judged(code, files, database);
   const auto version = database.queryInteger("PRAGMA user_version");
@@ -77,6 +81,7 @@ Attempt examine(const StoreFiles& files, Database& database) {
                         " or older, found version " + std::to_string(*version) +
                         ", made by a newer release")};
   }
+  // SQLite opens a file that it cannot write to without an error, for reading only.
   if (sqlite3_db_readonly(database.get(), "main") == 1) {
     return {Attempt::Outcome::kFailed,
             failure(StoreError::Kind::kDirectory, files, "cannot write to the database file")};

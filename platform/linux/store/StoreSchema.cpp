@@ -111,6 +111,8 @@ const std::int64_t kStoreSchemaVersion = kMigrations.size();
 SqliteCode migrate(Database& database) {
   const std::int64_t present = database.queryInteger("PRAGMA user_version").value_or(0);
   for (auto step = static_cast<std::size_t>(present); step < kMigrations.size(); ++step) {
+    // The version changes in the transaction of its step, so that no step is applied twice or in
+    // part.
     const SqliteCode code =
         database.execute("BEGIN IMMEDIATE;" + std::string(kMigrations[step]) +
                          "PRAGMA user_version = " + std::to_string(step + 1) + "; COMMIT");

@@ -38,6 +38,7 @@ void WriterQueue::requestRound() {
 
 bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
   const MutexLock lock(mutex_);
+  // Sleeps without a time limit: an idle service makes no wake-ups.
   while (queued_ == 0 && !closed_ && !roundRequested_) {
     writer_ = Writer::kIdle;
     work_.wait(mutex_);
@@ -47,6 +48,7 @@ bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
     writer_ = Writer::kGathering;
     work_.waitUntil(mutex_, notBefore);
   }
+  // From here on, records that are added wake nobody. The writer looks for them before it sleeps.
   writer_ = Writer::kWorking;
   workingSince_ = clock_();
   const bool wasRequested = std::exchange(roundRequested_, false);
@@ -64,9 +66,11 @@ void WriterQueue::finish(std::uint64_t records, std::uint64_t bytes) {
     waiting_ -= records;
     estimate(records, bytes);
     wakeCallers = callersWaiting_ > 0;
+    // A gap to the soft limit, so that connections are not stopped and started by turns.
     relieve = backpressure_.isHigh() && waiting_ <= softRecords_ / 4;
   }
   if (wakeCallers) room_.notifyAll();
+  // Outside the lock: the handler wakes the I/O thread, which may add records at once.
   if (relieve) backpressure_.relieve();
 }
 
