@@ -19,6 +19,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
+// A device or a wrong path must not fill the memory at the start.
 constexpr std::size_t kLargestFile = 1U << 20U;
 // Less than PATH_MAX, with room for the names of files below the path.
 constexpr std::size_t kLongestPath = 4000;
@@ -246,6 +247,8 @@ std::variant<Configuration, ConfigurationError> parse(const std::string& file,
                                                       std::string_view text,
                                                       const DefaultPlaces& places) {
   ConfigurationMistakes mistakes(file);
+  // Before the parser, which bounds brackets but not dots: a key of 100,000 words makes as many
+  // tables, and walking through them overflows the stack.
   if (const auto line = lineNestedTooDeep(text)) {
     mistakes.add(
         {static_cast<toml::source_index>(*line), 1},
@@ -287,6 +290,8 @@ std::filesystem::path configurationPath() {
   const std::filesystem::path own =
       environmentPath("XDG_CONFIG_HOME").value_or(homeDirectory() / ".config") /
       "halvox/halvox.toml";
+  // Only a file that is missing is passed over. One that cannot be read is an error, and must not
+  // be replaced by the system's in silence.
   const bool isMissing = ::access(own.c_str(), F_OK) != 0 && (errno == ENOENT || errno == ENOTDIR);
   return isMissing ? "/etc/halvox/halvox.toml" : own;
 }
@@ -309,6 +314,7 @@ std::variant<Configuration, ConfigurationError> loadConfiguration(const DefaultP
   if (auto* error = std::get_if<ConfigurationError>(&content)) return std::move(*error);
   const auto& text = std::get<std::optional<std::string>>(content);
   if (text.has_value()) return parse(file.native(), *text, places);
+  // Whoever names a file wants that file. A default place may be empty.
   if (configurationVariable() != nullptr) return unreadable(file, ENOENT);
   return defaultConfiguration(places);
 }

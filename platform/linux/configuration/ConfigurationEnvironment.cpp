@@ -12,13 +12,16 @@ std::optional<std::filesystem::path> environmentPath(const char* variable) {
   const char* value = std::getenv(variable);
   if (value == nullptr) return std::nullopt;
   const std::string_view list(value);
+  // systemd separates the directories of a unit by colons. The first one is ours.
   std::filesystem::path path(list.substr(0, list.find(':')));
+  // The XDG rules say that a relative path is to be ignored.
   if (!path.is_absolute()) return std::nullopt;
   return path;
 }
 
 std::filesystem::path homeDirectory() {
   if (auto home = environmentPath("HOME")) return *home;
+  // Services of the system are often started without HOME.
   passwd entry{};
   passwd* found = nullptr;
   std::array<char, 4096> buffer;
@@ -42,6 +45,7 @@ std::optional<std::filesystem::path> expandedPath(std::string_view text) {
 
 std::filesystem::path defaultSocketPath() {
   constexpr const char* kName = "reporting.sock";
+  // From systemd, with the directory already made and owned by the service's user.
   if (auto directory = environmentPath("RUNTIME_DIRECTORY")) return *directory / kName;
   if (auto directory = environmentPath("XDG_RUNTIME_DIR")) return *directory / "halvox" / kName;
   return std::filesystem::path("/run/halvox") / kName;

@@ -25,6 +25,8 @@ std::filesystem::path modulePath(const Module& module) {
   const auto program = std::filesystem::read_symlink("/proc/self/exe", error);
   const auto directory = program.parent_path();
   auto beside = directory / module.file;
+  // A build that is not installed has its modules beside the program. They win over installed ones,
+  // which may be of another build.
   if (std::filesystem::exists(beside, error)) return beside;
   // Relative to the program: an installation that was moved as a whole still finds its modules.
   return (directory / HALVOX_MODULES_FROM_PROGRAM / module.file).lexically_normal();
@@ -40,6 +42,7 @@ Result<void*> loadModule(const Module& module, const std::filesystem::path& path
   // at the first call.
   void* const library = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
   if (library == nullptr) return failure(lastError());
+  // Before the entry point: a module of another release may have one of the same name.
   const auto* const version = static_cast<const char*>(::dlsym(library, kVersionSymbol));
   if (version == nullptr) return failure(path.native() + " is not a module of this service");
   if (std::string_view(version) != halvoxVersion()) {

@@ -17,6 +17,7 @@ void CallbackThread::call(Callback callback) {
       return;
     }
   }
+  // The system has no thread to give. The callback must still not run on the caller's.
   dispatch_.asyncAfterOnBackgroundQueue(std::chrono::nanoseconds(0), std::move(callback));
 }
 
@@ -25,6 +26,7 @@ void CallbackThread::stop() {
   {
     const MutexLock lock(mutex_);
     isStopped_ = true;
+    // Joined without the lock, which the thread needs to end.
     last = std::move(thread_);
   }
   if (last.joinable()) last.join();
@@ -50,6 +52,8 @@ void CallbackThread::run() {
     {
       const MutexLock lock(mutex_);
       if (waiting_.empty()) {
+        // The thread ends at once instead of waiting for more: callbacks are as rare as starts of
+        // sessions.
         isRunning_ = false;
         return;
       }

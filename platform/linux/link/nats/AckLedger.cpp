@@ -29,6 +29,7 @@ void AckLedger::resolve(Number message, AckOutcome outcome) {
   Account ended;
   {
     const MutexLock lock(mutex_);
+    // Most messages belong to no flush yet.
     if (message >= current_.first) return note(current_, outcome);
     const auto flush = std::ranges::find_if(flushes_, [message](const Account& account) {
       return message >= account.first && message <= account.last;
@@ -46,6 +47,8 @@ AckLedger::FlushId AckLedger::flush(Done done) {
   Account account;
   {
     const MutexLock lock(mutex_);
+    // Messages that are sent from now on belong to the next flush: this one must end although
+    // others follow.
     account = std::exchange(current_, Account{});
     current_.first = account.last + 1;
     current_.last = account.last;

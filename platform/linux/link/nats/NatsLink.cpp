@@ -39,9 +39,12 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
   {
     const MutexLock lock(mutex_);
     const bool isRefused = closeBy_.has_value();
+    // The thread is made by the first session that asks: a service without sessions needs no link.
     if (!isRefused) failure = provideThread();
     if (!isRefused && failure.empty()) {
       wakeThread();
+      // Not called from here: `found` must run later, on a thread of ours. The session logs that it
+      // waits after this returns.
       if (state_ == State::kConnected) return answers_.push_back({std::move(found), servers_});
       waiter = ++lastWaiter_;
       waiters_.push_back({waiter, std::exchange(found, nullptr)});
@@ -53,6 +56,7 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
     return dispatch_.asyncAfterOnBackgroundQueue(
         std::chrono::nanoseconds(0), [found = std::move(found)] { found(std::nullopt); });
   }
+  // An attempt cannot be cancelled, so its callers are answered without waiting for its end.
   dispatch_.asyncAfterOnBackgroundQueue(kDiscoveryTime, [link = weak_from_this(), waiter] {
     if (const auto self = link.lock()) self->expire(waiter);
   });
@@ -63,6 +67,7 @@ void NatsLink::expire(std::uint64_t waiter) {
   {
     const MutexLock lock(mutex_);
     const auto place = std::ranges::find(waiters_, waiter, &Waiter::id);
+    // The attempt has answered this caller already.
     if (place == waiters_.end()) return;
     found = std::move(place->found);
     waiters_.erase(place);
@@ -102,12 +107,14 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
   {
     const MutexLock lock(mutex_);
     error = refusal(message.bytes);
+    // Under this lock: after close() has begun, the queue gains no message that nobody would count.
     if (!error) error = publisher_.take(message);
     if (!error) {
       wakeThread();
       return std::nullopt;
     }
   }
+  // Without the lock: the ledger may call back a flush, which may send.
   publisher_.refuse(message);
   return error;
 }
@@ -115,14 +122,17 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
 bool NatsLink::close() {
   {
     const MutexLock lock(mutex_);
+    // Called again: the thread that was left behind is still joinable.
     if (closeBy_) return !thread_.joinable();
     const Time now = std::chrono::steady_clock::now();
     closeBy_ = now + kCloseTime;
+    // An attempt that is under way may hang. A connection ends within known limits.
     leaveBy_ =
         state_ == State::kConnecting ? now + kAttemptEndTime : *closeBy_ + kConnectionEndTime;
     publisher_.beginEnd();
     changed_.notifyAll();
   }
+  // The thread may hang in the library with the lock of the connection. Neither can be destroyed.
   if (!awaitThread()) {
     kLog.notice("a NATS server does not answer; closing without it, unsent messages are dropped");
     giveUpRest();
@@ -143,6 +153,7 @@ bool NatsLink::awaitThread() {
   {
     const MutexLock lock(mutex_);
     if (!thread_.joinable()) return true;
+    // join() has no time limit.
     while (!hasThreadEnded_ && std::chrono::steady_clock::now() < leaveBy_) {
       changed_.waitUntil(mutex_, leaveBy_);
     }
@@ -179,6 +190,7 @@ std::string NatsLink::provideThread() {
 }
 
 void NatsLink::wakeThread() {
+  // Only for a thread that waits. One at work looks for the next step by itself.
   if (!std::exchange(isIdle_, false)) return;
   changed_.notifyAll();
 }
@@ -197,9 +209,11 @@ bool NatsLink::isAtEnd(Time now) {
 }
 
 NatsLink::Step NatsLink::nextStep(Time now) {
+  // The end before all other steps: close() waits for it with a limit.
   if (isAtEnd(now)) return Step::kEnd;
   if (!answers_.empty()) return Step::kTell;
   if (state_ == State::kLost) return Step::kDrop;
+  // Before connecting, which can take seconds: a flush waits for the messages that are overdue.
   if (const auto deadline = publisher_.firstDeadline(); deadline && now >= *deadline) {
     return Step::kAbandon;
   }
@@ -281,6 +295,7 @@ void NatsLink::end() {
     if (state_ != State::kConnected) leaveBy_ = std::chrono::steady_clock::now() + kAttemptEndTime;
     changed_.notifyAll();
   }
+  // Waits for what the library's threads still have to do, then closes.
   drain();
   dropConnection();
   answerWaiters();
@@ -300,6 +315,7 @@ void NatsLink::answerWaiters() {
     if (state_ == State::kConnected) servers = servers_;
   }
   tellAnswers();
+  // Without the lock: a callback may ask or send again.
   for (const Waiter& waiter : waiters) waiter.found(servers);
 }
 

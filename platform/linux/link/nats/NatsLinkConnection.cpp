@@ -65,6 +65,7 @@ natsStatus secure(natsOptions* options, const Configuration::Link& link) {
   if (status == NATS_OK && !tls.certificate.empty()) {
     status = natsOptions_LoadCertificatesChain(options, tls.certificate.c_str(), tls.key.c_str());
   }
+  // Only where the configuration says so. The library checks certificates and names by default.
   if (status == NATS_OK && !tls.verify) {
     status = natsOptions_SkipServerVerification(options, true);
   }
@@ -156,6 +157,7 @@ void NatsLink::connect() {
     lastFailure_.clear();
   }
   kLog.notice("connected to NATS");
+  // The library calls back for reconnections, not for the first connection.
   onAvailable(opened);
 }
 
@@ -225,6 +227,8 @@ void NatsLink::onAvailable(natsConnection* connection) {
   const std::int64_t maxPayload = natsConnection_GetMaxPayload(connection);
   const bool isConnected = natsConnection_Status(connection) == NATS_CONN_STATUS_CONNECTED;
   const MutexLock lock(mutex_);
+  // Reports of the library come on threads of its own and can be late: the connection may be
+  // another one, or closed by now.
   if (connection != connection_.get() || !isConnected || state_ == State::kLost) return;
   state_ = State::kConnected;
   servers_ = servers;
@@ -237,6 +241,7 @@ void NatsLink::onAway(natsConnection* connection) {
     const MutexLock lock(mutex_);
     if (connection != connection_.get()) return;
     if (state_ == State::kConnected) state_ = State::kAway;
+    // Before the library reconnects: what is published then would overtake what was on its way.
     publisher_.holdAfterLoss();
     changed_.notifyAll();
   }

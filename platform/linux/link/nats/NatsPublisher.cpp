@@ -90,6 +90,7 @@ void NatsPublisher::abandonAll() {
 
 void NatsPublisher::attach(jsCtx* context, std::chrono::nanoseconds duplicates) {
   context_ = context;
+  // A stream that others made may recognise identifiers for a shorter time than ours do.
   ackTime_ = std::min<std::chrono::nanoseconds>(kAckTime, duplicates / 2);
 }
 
@@ -145,9 +146,11 @@ NatsPublisher::Step NatsPublisher::nextStep(Time now) {
   // Half a window at a time: to wake the thread for every acknowledgement costs more than the
   // acknowledgement itself.
   if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
+  // Nothing is left whose order a probe could keep.
   if (pending_.size() == 0) flow_ = Flow::kFlowing;
   if (flow_ == Flow::kProbing) return Step::kWait;
   if (flow_ == Flow::kHolding) return now >= probeAt_ ? Step::kProbe : Step::kWait;
+  // Before the queue: messages that were published before must not be overtaken.
   if (pending_.needsAgain()) return pending_.hasAgain() ? Step::kSend : Step::kWait;
   return !queue_.empty() && !isWindowFull_ ? Step::kSend : Step::kWait;
 }
@@ -202,6 +205,7 @@ void NatsPublisher::publishSome() {
 }
 
 void NatsPublisher::probe() {
+  // First the stream: without it, this probe fails like the last one.
   provideStreamAgain();
   reclaim();
   std::vector<NatsMessage> messages;
@@ -255,6 +259,7 @@ void NatsPublisher::publish(std::vector<NatsMessage> messages, std::chrono::mill
   publishing.MaxWait = patience.count();
   for (std::size_t index = 0; index < messages.size(); ++index) {
     natsMsg* raw = messages[index].release();
+    // The call takes the message and sets `raw` to null, unless it fails.
     natsMsg* const key = raw;
     const natsStatus status = js_PublishMsgAsync(context_, &raw, &publishing);
     if (status == NATS_OK) continue;
@@ -276,6 +281,8 @@ void NatsPublisher::hold(std::span<NatsMessage> messages, natsStatus status) {
     for (NatsMessage& message : messages) {
       isKnown = pending_.giveBack(std::move(message)) || isKnown;
     }
+    // Each message of a window fails on its own. The first one begins the pause, and the others
+    // must not prolong it.
     if (!isKnown || flow_ == Flow::kHolding) return;
     const Time now = std::chrono::steady_clock::now();
     if (flow_ == Flow::kProbing && status == NATS_NO_RESPONDERS) isStreamInDoubt_ = true;
@@ -329,6 +336,7 @@ void NatsPublisher::resolve(NatsMessage message, const jsPubAckErr* error) {
     message.reset();
     const bool isProbed = flow_ == Flow::kProbing;
     if (isProbed) flow_ = Flow::kFlowing;
+    // Most acknowledgements wake nobody. These are the ones after which the thread can do more.
     isAwaited = isProbed || pending_.needsAgain() || (isWindowFull_ && pending_.isHalfFree()) ||
                 (isEnding_ && pending_.size() == 0);
   }

@@ -40,6 +40,7 @@ StreamProvision provideStream(jsCtx* context, const Configuration::Link& options
     provision.duplicates = std::chrono::nanoseconds(info.get()->Config->Duplicates);
     return provision;
   }
+  // Only a stream that is known not to exist is created. Other failures say nothing about it.
   if (status != NATS_NOT_FOUND && code != JSStreamNotFoundErr) {
     provision.failure = "cannot look up stream " + options.stream + ": " + describe(status);
     return provision;

@@ -126,6 +126,7 @@ TLMReportingOutcome NatsTlmReportingService::TLMReportingSendOneMessage(
 TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
                                                   const TLMReportingMessage& message) {
   if (auto ending = link_->refuseAtEnd()) return {.sent = false, .error = std::move(ending)};
+  // Encoded here, on the session's queue: one thread serves the link of all sessions.
   const std::string_view payload = encoder().encode(message.payload);
   std::string body;
   body.reserve(session.beginning().size() + payload.size() + 48);
@@ -136,6 +137,8 @@ TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
   body += R"(,"payload":)";
   body += payload;
   body += '}';
+  // The same identifier at each attempt: by it, the stream recognises a message that it has. The
+  // random part keeps a restarted service from using numbers again.
   std::string id = instance_ + "-";
   append(id, lastMessage_.fetch_add(1, std::memory_order_relaxed) + 1);
 
@@ -150,6 +153,7 @@ TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
   }
   outgoing.bytes = body.size() + kHeaderBytes;
   outgoing.ledger = session.ledger();
+  // Before the message is sent, because its acknowledgement may come before send() returns.
   if (outgoing.ledger) outgoing.number = outgoing.ledger->add();
   std::optional<Error> error = link_->send(std::move(outgoing));
   const bool sent = !error.has_value();
@@ -160,6 +164,7 @@ void NatsTlmReportingService::TLMReportingFlushMessages(const Session& session,
                                                         std::function<void()> flushed) {
   const auto linked = std::static_pointer_cast<LinkedSession>(session);
   const std::shared_ptr<AckLedger>& ledger = linked->ledger();
+  // A session that does not batch waits for no acknowledgement.
   if (!ledger) return flushed();
   const AckLedger::FlushId flush = ledger->flush(
       [name = linked->subject(), flushed = std::move(flushed)](const AckTally& tally) {
@@ -172,6 +177,7 @@ void NatsTlmReportingService::TLMReportingFlushMessages(const Session& session,
         flushed();
       });
   if (flush == 0) return;
+  // Weak: a flush that ended in time must not keep its session's account.
   dispatch_.asyncAfterOnBackgroundQueue(kFlushTime, [ledger = std::weak_ptr(ledger), flush] {
     if (const auto held = ledger.lock()) held->giveUp(flush);
   });
