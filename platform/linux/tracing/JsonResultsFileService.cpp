@@ -39,7 +39,6 @@ std::pair<std::string_view, std::string> split(std::string_view path) {
 
 // Keeps the values in memory until the file is finished: the file lists them by name, but they
 // arrive in any order.
-// in the file but do not come together.
 class ResultsFile final : public Sswriter {
  public:
   ResultsFile(std::string_view product, std::uint32_t version)
@@ -86,6 +85,7 @@ class ResultsFile final : public Sswriter {
       writeText(json, name);
       json.StartArray();
       for (const double value : values) {
+        // JSON has no NaN and no infinities. The place of the value in its list is kept.
         std::isfinite(value) ? json.Double(value) : json.Null();
       }
       json.EndArray();

@@ -150,6 +150,7 @@ std::optional<Data> PlistPropertyListService::readFile(std::string_view path,
     error = fileError("read", name, systemError);
     return std::nullopt;
   };
+  // The system would open the file whose name ends there.
   if (name.find('\0') != std::string::npos) return fail(EINVAL);
   const FileContent content = readWholeFile({.path = name.c_str(), .most = kMostFileBytes});
   switch (content.outcome) {
@@ -178,6 +179,7 @@ std::optional<Value> PlistPropertyListService::parse(const std::optional<Data>& 
   if (span.empty()) return fail("is empty");
   if (span.size() > kMostFileBytes) return fail("is too large");
   const std::string_view text(reinterpret_cast<const char*>(span.data()), span.size());
+  // Before the library sees a byte: it recurses, copies shared objects and asserts.
   if (const auto reason = whyUnreadable(text, kBounds)) return fail(*reason);
   List list;
   const auto length = static_cast<std::uint32_t>(text.size());

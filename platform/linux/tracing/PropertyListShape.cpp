@@ -80,6 +80,7 @@ class XmlShape {
     const std::size_t end = text_.find(terminator);
     if (end == std::string_view::npos) return kNotXml;
     const std::string_view inside = text_.substr(1, end);
+    // If the library ended this comment or text earlier, the rest would be tags.
     elements_ += static_cast<std::uint64_t>(std::ranges::count(inside, '<'));
     text_.remove_prefix(end + terminator.size());
     return elements_ > bounds_.elements ? kTooLarge : kMore;
@@ -189,6 +190,8 @@ class BinaryShape {
     if (child >= objects_) return kNotBinary;
     switch (weights_[child].state) {
       case Weight::State::kNew:
+        // Before the child is read: the stack of a list that nests without end must not grow with
+        // it.
         if (open_.size() > bounds_.depth) return kTooDeep;
         return push(child);  // and looks at it again when it is done
       case Weight::State::kOpen:
@@ -202,6 +205,7 @@ class BinaryShape {
 
   Reason take(Weight& parent, const Weight& child) const {
     parent.depth = static_cast<std::uint8_t>(std::max<int>(parent.depth, child.depth + 1));
+    // With each use of a shared object: the library makes a copy for each.
     parent.elements += child.elements;
     parent.bytes += child.bytes;
     if (parent.depth > bounds_.depth) return kTooDeep;

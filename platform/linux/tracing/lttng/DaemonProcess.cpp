@@ -23,6 +23,7 @@ std::string startTimeOf(pid_t pid) {
   for (int field = 0; field < kFieldsBetween && at != std::string::npos; ++field) {
     at = text.find(' ', at + 1);
   }
+  // A zombie has ended and only waits for its parent.
   if (at == std::string::npos || text.compare(name, 3, ") Z") == 0) return {};
   return text.substr(at + 1, text.find(' ', at + 1) - at - 1);
 }
@@ -43,6 +44,7 @@ std::optional<DaemonProcess> DaemonProcess::read(const std::filesystem::path& no
 bool DaemonProcess::write(const std::filesystem::path& noteFile) const {
   std::ofstream file(noteFile);
   file << pid << ' ' << startTime << '\n';
+  // Before the check: the bytes reach the file only now.
   file.close();
   return !file.fail();
 }
@@ -50,6 +52,7 @@ bool DaemonProcess::write(const std::filesystem::path& noteFile) const {
 bool DaemonProcess::isAlive() const { return !startTime.empty() && startTimeOf(pid) == startTime; }
 
 void DaemonProcess::end(std::chrono::milliseconds within) const {
+  // SIGTERM first: the daemon then ends its consumer and removes its sockets.
   for (const int signal : {SIGTERM, SIGKILL}) {
     if (isAlive()) ::kill(pid, signal);
     const auto deadline = std::chrono::steady_clock::now() + within;

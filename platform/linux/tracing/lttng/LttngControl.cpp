@@ -116,7 +116,10 @@ void LttngControl::removeLeftovers() {
   const MutexLock lock(mutex_);
   std::error_code ignored;
   const bool isRecorded = std::filesystem::exists(scratchDirectory_, ignored);
+  // Asking the tracer's library costs a connection to a daemon that may hang. Most starts need not
+  // ask.
   if (!isRecorded && !daemon_.isNoted()) return;
+  // Before the sessions are destroyed: if the daemon is ours, it must have a keeper again.
   daemon_.adopt(namePrefix());
   if (::lttng_session_daemon_alive() == 1) destroyTracerSessions(namePrefix());
   std::filesystem::remove_all(recordingDirectory_, ignored);
@@ -127,10 +130,13 @@ LttngControl::Failure LttngControl::begin(const RecordingPlan& plan, Recording& 
   const MutexLock lock(mutex_);
   std::error_code error;
   std::filesystem::create_directories(tracesDirectory_, error);
+  // The process ID tells these recordings from those that an earlier service left.
   recording.name = namePrefix() + std::to_string(::getpid()) + "-" + std::to_string(++begun_);
   recording.directory = scratchDirectory_ / recording.name;
   std::filesystem::create_directories(recording.directory, error);
   if (error) return "cannot create " + recording.directory.string() + ": " + error.message();
+  // Asked at each recording: a daemon that others started is used, and it may end between two
+  // traces.
   if (::lttng_session_daemon_alive() != 1) {
     if (auto failure = daemon_.start(namePrefix())) return failure;
   }
@@ -175,6 +181,7 @@ void LttngControl::discard(const Recording& recording) {
 
 void LttngControl::close() {
   const MutexLock lock(mutex_);
+  // Nothing was recorded, so there is nothing to ask the library for.
   if (begun_ == 0 && !daemon_.isOurs()) return;
   if (daemon_.isOurs()) {
     daemon_.leave();

@@ -100,6 +100,7 @@ std::shared_ptr<LttngKtraceSession> own(const KtraceService::Session& session, S
 
 bool DeliveryGate::enter() {
   const MutexLock lock(mutex_);
+  // If a trace is read faster than it is analysed, all of its events would be in memory.
   while (inside_ == most_ && !isStopping_) changed_.wait(mutex_);
   if (isStopping_) return false;
   ++inside_;
@@ -170,6 +171,8 @@ int LttngKtraceService::ktrace_events_range(const Session& session, std::uint32_
 int LttngKtraceService::ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) {
   const auto ours = own(session, State::kMade);
   if (ours == nullptr || queue == nullptr) return kUnsuitable;
+  // Also if the recording fails: the caller ends a trace that it has started, and waits for its
+  // completion.
   ours->state = State::kStarted;
   ours->queue = std::move(queue);
   started_.add();
@@ -192,6 +195,7 @@ void LttngKtraceService::ktrace_end(const Session& session, int /*reason*/) {
   auto ours = own(session, State::kStarted);
   if (ours == nullptr) return;
   ours->state = State::kEnded;
+  // Ending and reading take seconds. The caller must not wait for them.
   readingQueue()->async(JobWeight::kMayBlock, [this, ours = std::move(ours)] { finish(ours); });
 }
 
@@ -206,6 +210,7 @@ void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& sessi
     if (failure || !isRead) failed_.add();
     control_.discard(*session->recording);
   }
+  // After all batches, on the same queue, so the completion comes after the last event.
   session->queue->async(JobWeight::kMayBlock, [session] {
     // Moved out first: the handler may destroy the session, which releases its handlers.
     if (const auto completion = std::exchange(session->completion, nullptr)) completion();
@@ -227,6 +232,7 @@ bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
     return true;
   };
   const auto take = [&](trace_point point) {
+    // The clock is known anyway; the port has it only for sessions that ask.
     if (!session->hasWalltimes) point.walltime = 0;
     batch->add(point);
     return batch->size() < kBatchEvents || deliver();

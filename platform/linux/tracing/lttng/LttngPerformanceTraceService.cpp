@@ -95,6 +95,7 @@ struct LttngPerformanceTraceService::Work {
     const std::filesystem::path archive = control.tracesDirectory() / name;
     auto failure = packDirectory(recording.directory, archive);
     if (failure) return traceError("cannot save the trace: " + *failure);
+    // After the new archive is complete: a failure must not cost an old trace.
     removeOldTraces(control.tracesDirectory());
     url = "file://" + archive.string();
     return std::nullopt;
@@ -141,6 +142,7 @@ class LttngTraceSession final : public KQTraceSession,
   }
 
   void start() {
+    // A second start of one session would leave the first recording without an owner.
     if (recording_.has_value()) return;
     const auto error = work_->begin(recording_);
     if (const auto listener = delegate()) listener->kqTraceDidStart(error);

@@ -20,9 +20,13 @@ bool SessionDaemon::isNoted() const {
 }
 
 void SessionDaemon::adopt(const std::string& ownSessions) {
+  // The keeper of the last run may be ending its daemon just now. Adopting it would fail a moment
+  // later.
   TracerKeeper::awaitEarlier(noteFile_, keeperEndsWithin());
   ownSessions_ = ownSessions;
   auto noted = DaemonProcess::read(noteFile_);
+  // Compared by start time too: after a restart of the machine, the number may be that of another
+  // process.
   if (!noted || !noted->isAlive()) return forget();
   process_ = std::move(noted);
   // If there is no keeper now, leave() tries again to start one.
@@ -51,6 +55,7 @@ std::optional<std::string> SessionDaemon::start(const std::string& ownSessions) 
 
 void SessionDaemon::end() {
   if (!process_.has_value()) return;
+  // First the daemon: its keeper would ask it for its sessions, and wait if it hangs.
   process_->end(limits_.endsWithin);
   keeper_.release();
   forget();

@@ -59,6 +59,7 @@ Failure addFile(archive* to, const std::filesystem::path& path, const std::strin
   archive_entry_set_pathname(entry.get(), name.c_str());
   archive_entry_set_filetype(entry.get(), AE_IFREG);
   archive_entry_set_perm(entry.get(), kFilePermissions);
+  // The format has the size before the content, so a file must not change while it is packed.
   archive_entry_set_size(entry.get(), status.st_size);
   archive_entry_set_mtime(entry.get(), status.st_mtim.tv_sec, 0);
   if (archive_write_header(to, entry.get()) != ARCHIVE_OK) return archiveFailure(to);
@@ -90,11 +91,13 @@ Failure write(const std::filesystem::path& directory, int file) {
 
 Failure packDirectory(const std::filesystem::path& directory,
                       const std::filesystem::path& archive) {
+  // In the scratch directory: what a killed service leaves there is removed at the next start.
   const std::filesystem::path unfinished = directory.string() + ".unfinished";
   constexpr int kFlags = O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW;
   const UniqueFd file(::open(unfinished.c_str(), kFlags, kArchivePermissions));
   if (!file) return systemFailure(unfinished);
   Failure failure = write(directory, file.get());
+  // Before the name: after a power cut, an archive with a name must have its content.
   if (!failure && ::fsync(file.get()) != 0) failure = systemFailure(unfinished);
   if (!failure && ::rename(unfinished.c_str(), archive.c_str()) != 0) {
     failure = systemFailure(archive);

@@ -80,6 +80,7 @@ class Sink {
     if (status != BT_MESSAGE_ITERATOR_NEXT_STATUS_OK) return static_cast<Status>(status);
     auto& self = *static_cast<Sink*>(sink);
     for (std::uint64_t index = 0; index < count; ++index) {
+      // The others of the array are released unread: each message has a reference that must be put.
       if (self.wantsMore_) self.take(messages[index]);
       bt_message_put_ref(messages[index]);
     }
@@ -103,6 +104,7 @@ class Sink {
     if (name == nullptr || kEventName != name) return;
     const bt_clock_snapshot* const clock =
         bt_message_event_borrow_default_clock_snapshot_const(message);
+    // All streams of a recording have the clock of one machine.
     if (!hasClock_) takeClock(bt_clock_snapshot_borrow_clock_class_const(clock));
     trace_point point = read(event);
     point.timestamp = bt_clock_snapshot_get_value(clock);
@@ -273,6 +275,7 @@ std::uint64_t TraceClock::toNanoseconds(std::uint64_t ticks) const {
 TraceReading readTraces(const std::filesystem::path& directory, const TraceListener& listener) {
   TraceReading reading;
   const auto directories = traceDirectories(directory);
+  // Nothing was emitted while the trace ran, which is not a failure.
   if (directories.empty()) return reading;
   Sink sink(listener, reading);
   TraceGraph graph;

@@ -76,6 +76,7 @@ std::optional<std::string> TracerKeeper::launch(const Ward& ward, DaemonProcess&
   auto started = ChildProcess::start(program);
   if (!started) return started.error().message;
   keeper_ = *std::move(started);
+  // Only this process has the writing end. The kernel closes it, however the process ends.
   whileWeLive_ = std::move(life->writer);
   // Our copy of the writing end must go, or the end of the keeper would not end the reading.
   answer->writer.reset();
@@ -113,6 +114,7 @@ void TracerKeeper::awaitEarlier(const std::filesystem::path& noteFile, milliseco
 bool TracerKeeper::release() {
   whileWeLive_.reset();
   if (!keeper_) return false;
+  // After the pipe is closed, which tells the keeper to clean up.
   const ChildEnd end = keeper_->wait();
   keeper_.reset();
   return end.status >= 0;

@@ -40,7 +40,6 @@ class TracerKeeper {
   [[nodiscard]] std::optional<std::string> start(const Ward& ward, DaemonProcess& daemon);
   // Starts a keeper for a daemon that runs already. Returns why there is none, if there is none.
   [[nodiscard]] std::optional<std::string> keep(const Ward& ward, const DaemonProcess& daemon);
-  // Waits at most that time until no keeper, of an earlier service, holds the note any more.
   // Waits until no keeper of an earlier service holds the note, at most `within`.
   static void awaitEarlier(const std::filesystem::path& noteFile, std::chrono::milliseconds within);
   // Lets the keeper do its work as at the end of the service, and waits until it has ended. Returns

@@ -112,8 +112,11 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
   }
   // If the note cannot be written, only a service that starts after a killed keeper misses it.
   static_cast<void>(daemon->write(noteFile));
+  // After the note is written: a service that has this answer can be killed, and the next one finds
+  // the daemon.
   say(std::to_string(daemon->pid) + " " + daemon->startTime);
   awaitEndOfService();
+  // The note stays: the next service finds its daemon by it and gives it a keeper.
   if (daemon->isAlive() && isUsedByOthers(*daemon, ownSessions)) return EXIT_SUCCESS;
   daemon->end(kEndsWithin);
   std::filesystem::remove(noteFile, ignored);
@@ -133,6 +136,7 @@ int main(int count, char** arguments) {
     daemon = DaemonProcess{.pid = 0, .startTime = words[4]};
     const std::string& number = words[3];
     std::from_chars(number.data(), number.data() + number.size(), daemon->pid);
+    // kill() takes 0 and -1 for whole groups of processes, and 1 is init.
     if (daemon->pid <= 1) return EXIT_FAILURE;
   }
   return keep(words[1], words[2], std::move(daemon));
