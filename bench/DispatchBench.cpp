@@ -58,6 +58,7 @@ void handedOver(benchmark::State& state) {
   Fixture fixture;
   const auto total = std::make_shared<std::uint64_t>(0);
   for (auto _ : state) {
+    // From 1: the last job is the one that ends the wait.
     for (std::int64_t job = 1; job < state.range(0); ++job) {
       fixture.queue->async(JobWeight::kBrief, makeJob(total));
     }
@@ -67,6 +68,7 @@ void handedOver(benchmark::State& state) {
   }
   state.SetItemsProcessed(state.iterations() * state.range(0));
 }
+// The work is done on another thread, whose CPU time counts too.
 BENCHMARK(handedOver)->Arg(1)->Arg(8)->Arg(64)->UseRealTime()->MeasureProcessCPUTime();
 
 }  // namespace

@@ -120,6 +120,7 @@ void measureOne(const Sampler& sampler) {
     snapShots.push_back(milliseconds(Clock::now() - start));
     std::this_thread::sleep_for(kPause);
     const auto stop = Clock::now();
+    // A report that misses channels would be faster, and the measurement wrong.
     if (sampler.report(before) != kChannels) std::abort();
     reports.push_back(milliseconds(Clock::now() - stop));
   }
@@ -138,6 +139,7 @@ void measureQueue(const Sampler& sampler, const std::filesystem::path& directory
       sessions.push_back(sampler.snapShot());
       snapShots.push_back(milliseconds(Clock::now() - start));
     }
+    // All files change, so the first report has to read them again.
     writeFiles(directory, round + 2);
     for (const SnapShot& session : sessions) {
       const auto start = Clock::now();
@@ -177,6 +179,7 @@ void measureThreads(const Sampler& sampler) {
 void measureMemory(const Sampler& sampler) {
   std::vector<SnapShot> sessions;
   sessions.reserve(kSessions);
+  // Not counted: what the first snapshot makes once.
   static_cast<void>(sampler.snapShot());
   const std::size_t before = mallinfo2().uordblks;
   for (int session = 0; session < kSessions; ++session) {

@@ -84,6 +84,7 @@ double measureLibrary(jsCtx* context, const std::string& body, std::size_t messa
   const auto began = Clock::now();
   for (std::size_t number = 0; number < messages; ++number) {
     char id[40];
+    // An identifier of its own for each message: the server drops those that it has seen.
     std::snprintf(id, sizeof id, "plain%011d-%zu", round, number);
     options.MsgId = id;
     if (js_PublishAsync(context, "halvox.playback_session.1", body.data(),
@@ -125,6 +126,7 @@ void compare(TLMReportingService& link, const char* url, Run run) {
   jsOptions_Init(&options);
   options.PublishAsync.MaxPending = kPending;
   options.PublishAsync.StallWait = 10'000;
+  // Warms up, and makes the stream and the message that the library then publishes.
   static_cast<void>(measureBackend(link, run.messages / 10));
   if (natsConnection_ConnectTo(connection.out(), url) != NATS_OK ||
       natsConnection_JetStream(context.out(), connection.get(), &options) != NATS_OK) {
@@ -134,6 +136,7 @@ void compare(TLMReportingService& link, const char* url, Run run) {
   std::vector<double> backend;
   std::vector<double> library;
   for (int round = 0; round < run.rounds; ++round) {
+    // In turns, so that other work on the machine meets both alike.
     backend.push_back(measureBackend(link, run.messages));
     library.push_back(measureLibrary(context.get(), body, run.messages));
   }
@@ -163,6 +166,7 @@ int main(int argc, char** argv) {
           {.messages = argc > 2 ? std::strtoul(argv[2], nullptr, 10) : 50'000,
            .rounds = argc > 3 ? std::atoi(argv[3]) : 5});
   static_cast<void>(dispatch.stop(std::chrono::seconds(5)));
+  // A thread that did not end may still use what would be destroyed.
   if (!link->close()) std::quick_exit(EXIT_FAILURE);
   return EXIT_SUCCESS;
 }

@@ -144,6 +144,8 @@ class JetStream {
     const auto width = static_cast<int>(std::string(id).size());
     jsPubOptions options;
     jsPubOptions_Init(&options);
+    // The plain library publishes in this process, the service in its own. Each is charged with the
+    // process that does the work.
     const Stopwatch watch(ownCpu);
     for (std::int64_t number = 0; number < messages; ++number) {
       char text[64];
@@ -189,9 +191,11 @@ std::int64_t storedMessages(const std::string& path) {
 Result through(const Server& server, std::int64_t messages,
                const std::function<std::int64_t()>& stored) {
   const MessageShape shape;
+  // The runs to JetStream share one stream, which still holds the messages of the runs before.
   const std::int64_t before = stored();
   const auto client = server.client(1);
   client->pipeline(kWarmUp, kWindow, shape);
+  // Waits until they are stored: their work must not count as that of the measured ones.
   waitUntil("the first messages", [&] { return stored() >= before + kWarmUp; });
   const Stopwatch watch([&server] { return server.process().cpuTime(); });
   client->pipeline(messages, kWindow, shape);

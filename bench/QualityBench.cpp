@@ -34,6 +34,7 @@ constexpr std::size_t kFloodQueues = 4;  // more than the pool has threads
 
 void work(std::chrono::microseconds time) {
   const auto end = Clock::now() + time;
+  // Spins instead of sleeping, because the flood must compete for the processors.
   while (Clock::now() < end) {
   }
 }
@@ -51,6 +52,7 @@ class Flood {
   Flood(const Flood&) = delete;
   Flood& operator=(const Flood&) = delete;
   ~Flood() {
+    // Each queue has at most one more job, after which the one below ends the wait.
     *isOver_ = true;
     for (const auto& queue : queues_) {
       std::promise<void> done;
@@ -93,6 +95,8 @@ void measureRound(DispatchService& service, DispatchQueue& requests, Kind& kind)
   auto next = Clock::now();
   for (int request = 0; request < kRequestsARound; ++request) {
     next += kRequestPause;
+    // At fixed times, not after a fixed pause: a request that waited long does not thin out the
+    // ones after it.
     std::this_thread::sleep_until(next);
     std::promise<Clock::time_point> ended;
     const auto began = Clock::now();

@@ -35,6 +35,7 @@ Bus makeBus(int fd) {
   sd_bus_new(&bus);
   sd_bus_set_fd(bus, fd, fd);
   sd_bus_set_server(bus, 1, id);
+  // The least that sd-bus can do: it does not authenticate the client and takes no descriptors.
   sd_bus_set_anonymous(bus, 1);
   sd_bus_negotiate_fds(bus, 0);
   sd_bus_start(bus);
@@ -52,6 +53,7 @@ void watch(int poller, int fd, int operation, std::uint32_t events) {
 // Handles what has arrived. Returns false when the connection has ended.
 bool serve(int poller, int fd, sd_bus* bus) {
   int result = 0;
+  // Until nothing is left: sd-bus may hold complete messages that epoll does not report again.
   while ((result = sd_bus_process(bus, nullptr)) > 0) {
   }
   if (result < 0) return false;

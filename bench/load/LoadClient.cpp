@@ -140,6 +140,7 @@ void LoadClient::pipeline(std::int64_t count, std::int64_t window, const Message
   std::int64_t sent = 0;
   while (answered_ < count) {
     while (sent < count && sent - answered_ < window) {
+      // The number is a field of the message: equal numbers make equal messages.
       sendOne(shape.content == Content::kDistinct ? sent : 0, shape);
       ++sent;
     }
@@ -163,6 +164,7 @@ std::vector<double> LoadClient::ping(int count, const MessageShape& shape) {
     check(sd_bus_call(bus_, message.get(), 0, nullptr, &reply), "send");
     seconds.push_back(std::chrono::duration<double>(Clock::now() - begin).count());
     sd_bus_message_unref(reply);
+    // After the answer, so that at most one request is on its way.
     std::this_thread::sleep_until(begin + std::chrono::milliseconds(1));
   }
   return seconds;

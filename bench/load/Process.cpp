@@ -90,6 +90,7 @@ void Process::waitForRest() const {
   for (;;) {
     std::this_thread::sleep_for(kLook);
     const nanoseconds now = cpuTime();
+    // 5 % of one processor.
     if (now - before < kLook / 20) return;
     before = now;
   }

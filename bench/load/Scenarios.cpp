@@ -94,6 +94,8 @@ void measureThroughput(const LoadOptions& options, std::vector<Measurement>& res
   std::vector<Cost> stored;
   std::vector<Cost> unwanted;
   for (int round = 0; round < options.rounds; ++round) {
+    // One run of each kind a round: other work on the machine then changes all of them, and the
+    // ratios less.
     echo.push_back(oneRun(options, ServerKind::kEcho));
     linked.push_back(oneRun(options, ServerKind::kStored, kLocalLink));
     stored.push_back(oneRun(options, ServerKind::kStored));
@@ -167,6 +169,7 @@ void measureMemory(const LoadOptions& options, std::vector<Measurement>& results
   const Server server(options.programs, ServerKind::kUnwanted);
   const auto client = server.client(1);
   client->pipeline(5000, options.window, options.shape);
+  // After a warm-up: the first messages make the pools and tables that later ones use.
   const long before = server.process().residentKib();
   client->pipeline(options.messages, options.window, options.shape);
   const auto grown = static_cast<double>(server.process().residentKib() - before) * 1024;
@@ -196,6 +199,7 @@ void measureGrowth(const LoadOptions& options, std::vector<Measurement>& results
           idle.push_back(server.client(10'000 + number));
         }
       }));
+  // Their connections would count in the next measurement.
   idle.clear();
   add("with 1,000,000 messages of history",
       serverMicrosAfter(options, [&options](const Server&, LoadClient& client) {
@@ -207,6 +211,7 @@ void measureIdle(const LoadOptions& options, std::vector<Measurement>& results) 
   const Server server(options.programs, ServerKind::kStored);
   const auto client = server.client(1);
   client->pipeline(1000, options.window, options.shape);
+  // Work that is still queued would count as wake-ups.
   static_cast<void>(server.process().settledCpuTime());
   const long before = server.process().sleeps();
   std::this_thread::sleep_for(std::chrono::seconds(10));

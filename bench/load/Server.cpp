@@ -25,6 +25,8 @@ std::unique_ptr<Process> Server::start(const ServerPrograms& programs,
                                      std::vector<std::string>{});
   }
   const std::string config = directory_.path("halvox.toml");
+  // The limits are far beyond what a scenario needs: a client that is refused, or a store that
+  // deletes old records, would measure something else.
   std::ofstream(config) << "[listener]\nsocket = \"" << socket_ << "\"\n[storage]\ndirectory = \""
                         << directory_.path("state") << "\"\nmax_megabytes = 8192\n"
                         << "[analytics]\nwanted = ["

@@ -43,6 +43,7 @@ class OtherClient {
     auto next = Clock::now();
     while (!ending_) {
       waits_.push_back(client_->ask());
+      // A long wait is not made up for by a burst of requests.
       next = std::max(next + kAskEvery, Clock::now());
       std::this_thread::sleep_until(next);
     }
@@ -63,6 +64,7 @@ void measure(const LoadOptions& options, const Build& build, std::vector<Measure
   const Server server(options.programs, ServerKind::kStored, build.settings);
   const auto client = server.client(1);
   client->pipeline(kHistory, options.window, options.shape);
+  // The service still stores what it has answered; that work does not belong to the stop.
   server.process().waitForRest();
   const long before = server.process().residentKib();
   server.process().forgetPeak();

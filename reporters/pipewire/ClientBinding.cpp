@@ -18,6 +18,7 @@ ClientBinding::ClientBinding(pw_registry* registry, std::uint32_t id, std::funct
 
 void ClientBinding::onInfo(void* data, const pw_client_info* info) {
   auto* self = static_cast<ClientBinding*>(data);
+  // The event comes for other changes too, with the same properties.
   if ((info->change_mask & PW_CLIENT_CHANGE_MASK_PROPS) != 0) {
     self->properties_ = makeProperties(info->props);
     self->changed_();

@@ -11,6 +11,7 @@ Properties makeProperties(const spa_dict* dict) {
   }
   const spa_dict_item* item = nullptr;
   spa_dict_for_each(item, dict) {
+    // A dictionary of another process may have entries without either.
     if (item->key != nullptr && item->value != nullptr) {
       properties.insert_or_assign(item->key, item->value);
     }

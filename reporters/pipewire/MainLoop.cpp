@@ -25,6 +25,7 @@ class MainLoop::Impl {
     }
   }
   ~Impl() {
+    // Destroys the loop's sources as well, before the library is shut down.
     pw_main_loop_destroy(loop_);
     pw_deinit();
   }
@@ -36,11 +37,15 @@ class MainLoop::Impl {
   void quit() { pw_main_loop_quit(loop_); }
 
   std::function<void()> makeNotifier(std::function<void()> call) {
+    // Each call has its own allocation: the library keeps its address, which must not change when
+    // the vector grows.
     calls_.push_back(std::make_unique<std::function<void()>>(std::move(call)));
     spa_source* source = pw_loop_add_event(handle(), &Impl::onEvent, calls_.back().get());
     if (source == nullptr) {
       throw std::runtime_error("cannot create an event for the event loop");
     }
+    // The library counts signals that have not been handled, and runs the call once for all of
+    // them.
     return [loop = handle(), source] { pw_loop_signal_event(loop, source); };
   }
 

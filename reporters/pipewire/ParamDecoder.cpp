@@ -42,6 +42,8 @@ std::optional<std::vector<float>> readFloats(const spa_pod& value) {
       SPA_POD_ARRAY_VALUE_SIZE(&value) != sizeof(float)) {
     return std::nullopt;
   }
+  // The size of the array is what its sender says. More channels than PipeWire allows are not
+  // volumes.
   std::vector<float> numbers(std::min(count, std::uint32_t{SPA_AUDIO_MAX_CHANNELS}));
   std::memcpy(numbers.data(), elements, numbers.size() * sizeof(float));
   return numbers;
@@ -59,6 +61,7 @@ std::optional<StreamFormat> readRawFormat(const spa_pod* param) {
                            SPA_FORMAT_AUDIO_channels, SPA_POD_OPT_Int(&channels)) < 0) {
     return std::nullopt;
   }
+  // Negative numbers come from a faulty client and count as unknown.
   return StreamFormat{.encoding = typeName(spa_type_audio_format, encoding),
                       .rate = static_cast<std::uint32_t>(std::max(rate, 0)),
                       .channels = static_cast<std::uint32_t>(std::max(channels, 0))};
@@ -73,6 +76,7 @@ std::optional<StreamFormat> decodeFormat(const spa_pod* param) {
       type != SPA_MEDIA_TYPE_audio) {
     return std::nullopt;
   }
+  // Coded audio has a codec in place of a sample format.
   if (subtype != SPA_MEDIA_SUBTYPE_raw) {
     return StreamFormat{.encoding = typeName(spa_type_media_subtype, subtype)};
   }
@@ -84,6 +88,7 @@ VolumeChange decodeVolume(const spa_pod* param) {
   if (param == nullptr || !spa_pod_is_object_type(param, SPA_TYPE_OBJECT_Props)) {
     return change;
   }
+  // The library's loop over properties takes a pointer that is not const, but changes nothing.
   auto* object = reinterpret_cast<spa_pod_object*>(const_cast<spa_pod*>(param));
   spa_pod_prop* prop = nullptr;
   SPA_POD_OBJECT_FOREACH(object, prop) {

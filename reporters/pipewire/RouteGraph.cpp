@@ -10,6 +10,7 @@ void RouteGraph::addDevice(GlobalID id, Route::Device device) { devices_[id] = s
 void RouteGraph::removeDevice(GlobalID id) { devices_.erase(id); }
 
 void RouteGraph::addLink(GlobalID id, Link link) {
+  // A link that is announced twice must not be counted twice: its removal comes once.
   if (!links_.emplace(id, link).second) {
     return;
   }
@@ -44,12 +45,15 @@ Route RouteGraph::routeOf(GlobalID stream, Direction direction) const {
     }
   }
   std::ranges::sort(route.devices);
+  // Sorted and without repeats, so that a route that is the same compares equal whatever the order
+  // of the links.
   route.devices.erase(std::unique(route.devices.begin(), route.devices.end()), route.devices.end());
   return route;
 }
 
 void RouteGraph::release(PeerMap& map, GlobalID from, GlobalID peer) {
   Peers& peers = map[from];
+  // A stereo stream has two links to its device; the device stays until the last one is removed.
   if (--peers[peer] == 0) {
     peers.erase(peer);
   }

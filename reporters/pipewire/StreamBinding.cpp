@@ -17,6 +17,8 @@ StreamBinding::StreamBinding(pw_registry* registry, std::uint32_t id, StreamList
     return;
   }
   binding_.listen(&kEvents, this);
+  // The server sends the current values at once, and new ones when they change: nothing has to be
+  // polled.
   std::array<std::uint32_t, 2> params{SPA_PARAM_Format, SPA_PARAM_Props};
   auto* node = reinterpret_cast<pw_node*>(binding_.proxy());
   pw_node_subscribe_params(node, params.data(), params.size());
@@ -24,6 +26,8 @@ StreamBinding::StreamBinding(pw_registry* registry, std::uint32_t id, StreamList
 
 void StreamBinding::onInfo(void* data, const pw_node_info* info) {
   auto* self = static_cast<StreamBinding*>(data);
+  // Properties before the state: the tracker learns of a stream by its properties, and ignores the
+  // state of streams that it does not know.
   if ((info->change_mask & PW_NODE_CHANGE_MASK_PROPS) != 0) {
     self->properties_ = makeProperties(info->props);
     self->listener_.onStreamProperties(self->id_, self->properties_);

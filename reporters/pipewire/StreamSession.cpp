@@ -55,6 +55,7 @@ StreamSession::StreamSession(ReportingClient& client, Identity identity,
 }
 
 StreamSession::~StreamSession() {
+  // Ends the run first, so that its Stop and its volume reach the session before it is stopped.
   setRunning(false);
   if (started_) {
     client_.stop(identity_.reporterID);
@@ -73,6 +74,8 @@ void StreamSession::setProperties(const Properties& properties) {
   const platform::Dictionary changed =
       changedEntries(configuration_, makeConfiguration(properties));
   if (!changed.empty()) {
+    // A configuration can only grow, because the service never removes a key. A property that
+    // disappears keeps its last value here too.
     configuration_.merge(changed);
     client_.setConfiguration(identity_.reporterID, changed);
   }
@@ -134,6 +137,8 @@ void StreamSession::restate() {
   if (!started_) {
     return;
   }
+  // The service has lost its history with its sessions, so even a volume that has not changed is
+  // news to it.
   sentVolume_.reset();
   sendFormat();
   sendRoute();
@@ -153,6 +158,7 @@ void StreamSession::beginRun() {
 }
 
 void StreamSession::endRun() {
+  // Before the Stop: what was lost belongs to this run.
   if (const auto lost = xruns_.takeRest()) {
     sendXrun(*lost);
   }

@@ -41,6 +41,7 @@ ReporterID reporterIDFor(std::uint32_t serverCookie, std::uint64_t serial) {
 void StreamTracker::serverConnected(std::uint32_t cookie) { cookie_ = cookie; }
 
 void StreamTracker::serverLost() {
+  // The destructor of each session sends its end.
   streams_.clear();
   reporterIDs_.clear();
   graph_.clear();
@@ -55,6 +56,7 @@ void StreamTracker::serviceRestarted() {
 void StreamTracker::nodeAdded(const Node& node) {
   if (const auto direction = streamDirection(node.mediaClass)) {
     addStream(node, *direction);
+    // Streams of video or MIDI are neither streams for us nor devices.
   } else if (!node.mediaClass.starts_with("Stream/")) {
     graph_.addDevice(node.id, makeDevice(node));
   }
@@ -133,6 +135,7 @@ void StreamTracker::addStream(const Node& node, Direction direction) {
           .reporterID = reporterID, .serial = node.serial, .direction = direction},
       node.properties);
   streams_.emplace(node.id, Entry{.reporterID = reporterID, .session = std::move(session)});
+  // The links of a stream may have been announced before the stream itself.
   updateRoute(node.id);
 }
 

@@ -24,6 +24,7 @@ bool isVolume(float volume) { return std::isfinite(volume) && volume >= 0; }
 std::string cleanText(std::string_view text) {
   constexpr std::size_t kLongestCharacter = 4;
   std::string result;
+  // Leaves room for the longest character: the text is never cut within one.
   while (!text.empty() && result.size() + kLongestCharacter <= kMaxTextBytes) {
     const platform::linux_::Utf8Step step = platform::linux_::nextUtf8(text);
     const bool isKept = step.valid && !isControl(step.character);
@@ -58,6 +59,7 @@ void StreamVolume::apply(const VolumeChange& change) {
     volume_ = change.volume;
   }
   if (change.channels && !change.channels->empty() &&
+      // One bad channel makes the whole array doubtful; the volumes that were known before stay.
       std::all_of(change.channels->begin(), change.channels->end(), isVolume)) {
     loudest_ = *std::max_element(change.channels->begin(), change.channels->end());
   }
@@ -68,6 +70,7 @@ std::optional<double> StreamVolume::effective() const {
   if (!volume_ && !loudest_) {
     return std::nullopt;
   }
+  // Muted is volume 0 and not silence: the stream still plays.
   if (muted_) {
     return 0.0;
   }

@@ -28,6 +28,7 @@ namespace {
 using pipewire::ProfiledCycle;
 using pipewire::ProfilerBinding;
 using std::chrono::milliseconds;
+// Not 0, which would disarm the timer.
 constexpr milliseconds kReconnectSoon{1};
 constexpr milliseconds kReconnectMin{100};
 constexpr milliseconds kReconnectMax{5000};
@@ -80,6 +81,8 @@ class StreamWatcher::Impl final : public StreamListener, private pipewire::Serve
       throw std::runtime_error(
           fmt::format("cannot set up PipeWire's library: {}", platform::linux_::errnoText(errno)));
     }
+    // Loaded before the connection: the library must know the profiler's interface when it is
+    // bound.
     if (options_.xruns && !pipewire::loadProfilerModule(context_.get())) {
       options_.xruns = false;
       options_.log("xruns are not reported: PipeWire's profiler module is not installed");
@@ -143,6 +146,7 @@ void StreamWatcher::Impl::connect() {
   if (server_.connect(properties)) {
     return;
   }
+  // Logged once for each time without a server, not at each attempt.
   if (!std::exchange(waitingTold_, true)) {
     options_.log(fmt::format("waiting for PipeWire: {}", platform::linux_::errnoText(errno)));
   }
@@ -154,6 +158,7 @@ void StreamWatcher::Impl::disconnect() {
   if (!server_.isConnected()) {
     return;
   }
+  // Bindings are destroyed before the connection that they belong to.
   profiler_.reset();
   profilerID_.reset();
   streams_.clear();
@@ -208,6 +213,7 @@ void StreamWatcher::Impl::onProfile(const spa_pod* profile) {
 
 void StreamWatcher::Impl::clientChanged(GlobalID id) {
   for (const auto& [streamID, stream] : streams_) {
+    // The properties of a client may arrive after those of its streams.
     if (stream.told && idProperty(stream.binding->properties(), kClientIDProperty) == id) {
       tracker_.streamPropertiesChanged(streamID, fullProperties(stream.binding->properties()));
     }
@@ -286,6 +292,7 @@ void StreamWatcher::Impl::onGlobal(const pipewire::Global& global) {
 }
 
 void StreamWatcher::Impl::onGlobalRemoved(GlobalID id) {
+  // An object that is removed can be of any kind: the event has only its ID.
   streams_.erase(id);
   clients_.erase(id);
   if (profilerID_ == id) {

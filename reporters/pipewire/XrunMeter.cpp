@@ -9,6 +9,7 @@ void XrunMeter::add(Time cycle, Seconds lost) {
 }
 
 std::optional<XrunMeter::Seconds> XrunMeter::takeDue(Time now) {
+  // A time before the last report means that the clock was set back.
   if (lastReport_.has_value() && now >= *lastReport_ && now - *lastReport_ < kDistance) {
     return std::nullopt;
   }

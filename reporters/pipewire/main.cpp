@@ -24,6 +24,7 @@ using namespace halvox::pipewire_reporter;  // the program's own
 constexpr int kExitUsage = 2;
 constexpr int kExitSoftware = 70;
 constexpr int kExitConfiguration = 78;
+// How long the end waits at most for the service to answer the last messages.
 constexpr std::chrono::seconds kFarewell{1};
 
 struct Arguments {
@@ -75,6 +76,8 @@ bool completeFromConfiguration(Arguments& arguments) {
 }
 
 void run(const Arguments& arguments) {
+  // Before the client, which has a thread: the loop blocks the signals, and later threads inherit
+  // that.
   MainLoop loop;
   halvox::client::HalvoxClient client({.socketPath = arguments.socket});
   HalvoxReportingClient handOver(client);
@@ -91,6 +94,8 @@ void run(const Arguments& arguments) {
     wasLost = wasLost || !connected;
   });
   {
+    // Destroyed before the flush: its end stops all sessions, and the flush waits for their last
+    // messages.
     const StreamWatcher watcher(
         loop.handle(), tracker,
         {.remote = arguments.remote, .log = logLine, .xruns = !arguments.noXruns});
