@@ -71,7 +71,7 @@ TEST_F(ChildProcessTest, MissingProgramIsAnErrorThatNamesIt) {
   EXPECT_EQ(child.error().message, "cannot start no-such-program: No such file or directory");
 }
 
-TEST_F(ChildProcessTest, TellsHowTheChildEnded) {
+TEST_F(ChildProcessTest, ReportsHowTheChildEnded) {
   const ChildEnd exited = start(shell("exit 3")).wait();
   const ChildEnd killed = start(shell("kill -TERM $$")).wait();
 

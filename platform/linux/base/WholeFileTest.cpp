@@ -154,7 +154,7 @@ TEST_F(WholeFileTest, AnyKindDoesNotWaitForAWriterAndBoundsADevice) {
   EXPECT_EQ(endless.outcome, Outcome::kTooLarge);
 }
 
-TEST_F(WholeFileTest, FollowsLinksUnlessToldNotTo) {
+TEST_F(WholeFileTest, FollowsLinksUnlessTheyAreRefused) {
   const std::string path = write("file", "text");
   const std::string link = directory_ / "link";
   ASSERT_EQ(::symlink(path.c_str(), link.c_str()), 0);

@@ -20,7 +20,7 @@ struct MistakeCase {
 class ConfigurationMistakesTest : public ConfigurationFixture,
                                   public ::testing::WithParamInterface<MistakeCase> {};
 
-TEST_P(ConfigurationMistakesTest, IsToldWithItsPlace) {
+TEST_P(ConfigurationMistakesTest, IsReportedWithItsPlace) {
   EXPECT_EQ(mistake(GetParam().text), GetParam().mistake);
 }
 
@@ -139,7 +139,7 @@ TEST_F(ConfigurationMistakesTest, SocketPathMustFitIntoAnAddress) {
 }
 
 // Walking through the tables that such a key makes would overflow the stack.
-TEST_F(ConfigurationMistakesTest, KeyOfManyWordsIsToldWithItsLine) {
+TEST_F(ConfigurationMistakesTest, KeyOfManyWordsIsReportedWithItsLine) {
   std::string key = "a";
   for (int count = 1; count < 100'000; ++count) key += ".a";
 
@@ -149,7 +149,7 @@ TEST_F(ConfigurationMistakesTest, KeyOfManyWordsIsToldWithItsLine) {
   }
 }
 
-TEST_F(ConfigurationMistakesTest, SyntaxErrorIsToldWithItsPlace) {
+TEST_F(ConfigurationMistakesTest, SyntaxErrorIsReportedWithItsPlace) {
   EXPECT_THAT(mistake("[listener]\nsocket = = 3\n"),
               StartsWith("2:10: the file: expected TOML, found a mistake: "));
 }

@@ -24,7 +24,7 @@ TEST_F(ConfigurationTest, MissingFileMeansDefaults) {
   EXPECT_EQ(configuration.analytics.wanted, std::vector<std::string>{"*"});
 }
 
-TEST_F(ConfigurationTest, LevelsOfTheLogAndOfItsMemoryAreTwoThings) {
+TEST_F(ConfigurationTest, LevelsOfTheLogAndOfItsMemoryAreIndependent) {
   const Configuration written = loaded("[log]\nlevel = \"error\"");
   const Configuration kept = loaded("[log]\nmemory_level = \"debug\"");
 
@@ -76,7 +76,7 @@ TEST_F(ConfigurationTest, ProgramsMayHaveOtherPlacesByDefault) {
   EXPECT_EQ(configuration.notifyDirectory, "/there/notify");
 }
 
-TEST_F(ConfigurationTest, TheSocketIsToldToProgramsOnlyWhenItIsNamed) {
+TEST_F(ConfigurationTest, ProgramsGetTheSocketOnlyWhenTheFileNamesIt) {
   ::setenv("XDG_RUNTIME_DIR", "/run/user/7", 1);
   ::setenv("HALVOX_CONFIG", write("").c_str(), 1);
   EXPECT_EQ(std::get<std::filesystem::path>(configuredSocket()), "");

@@ -57,7 +57,7 @@ TEST(TomlNestingTest, QuotesAtTheEndOfALongTextHideNothing) {
   }
 }
 
-TEST(TomlNestingTest, TellsTheFirstLineThatIsTooDeep) {
+TEST(TomlNestingTest, ReturnsTheFirstLineThatIsTooDeep) {
   EXPECT_EQ(lineNestedTooDeep("a.b = 1\n"), std::nullopt);
   EXPECT_EQ(lineNestedTooDeep(key(1000)), 1U);
   EXPECT_EQ(lineNestedTooDeep("a = \"\"\"\n\n\"\"\"\n" + key(1000) + "\n" + key(1000)), 4U);

@@ -23,12 +23,12 @@ TEST(BusAddressTest, EscapesAreResolved) {
               ElementsAre(BusSocket{Space::kFile, "/a b,;c"}));
 }
 
-TEST(BusAddressTest, OtherTransportsAreLeftOut) {
+TEST(BusAddressTest, OtherTransportsAreSkipped) {
   EXPECT_THAT(parseBusAddress("tcp:host=localhost,port=1;unix:path=/a;autolaunch:"),
               ElementsAre(BusSocket{Space::kFile, "/a"}));
 }
 
-TEST(BusAddressTest, NonsenseIsLeftOut) {
+TEST(BusAddressTest, NonsenseIsSkipped) {
   EXPECT_THAT(parseBusAddress("unix:path=/a%2"), IsEmpty());
   EXPECT_THAT(parseBusAddress("unix:path=/a%zz"), IsEmpty());
   EXPECT_THAT(parseBusAddress("unix:path="), IsEmpty());

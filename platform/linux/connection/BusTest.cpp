@@ -163,7 +163,7 @@ TEST_F(BusTest, BothWaysInAreServedAtOnce) {
   EXPECT_EQ(onSocket.call("echo", "b").text, "b");
 }
 
-TEST_F(BusTest, NameThatIsTakenIsTold) {
+TEST_F(BusTest, TakenNameIsAnError) {
   const ScratchDirectory directory;
   Backpressure backpressure;
   ConnectionOptions options;
@@ -239,7 +239,7 @@ TEST_F(BusTest, WhatASenderSendsBeyondWhatMayWaitIsRefused) {
       eventually([&] { return service_.count("requests refused: too many waiting") == 3U; }));
 }
 
-TEST(BusStartTest, BusThatIsNotThereIsTold) {
+TEST(BusStartTest, MissingBusIsAnError) {
   const ScratchDirectory directory;
   FakePlatform platform;
   Backpressure backpressure;

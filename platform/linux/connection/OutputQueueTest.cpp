@@ -80,7 +80,7 @@ TEST_F(OutputQueueTest, FrameCountsAsUnsentUntilItsLastByteIsTaken) {
   EXPECT_EQ(queue_.unsentBytes(), 1000U * 1000U - sentBytes_);
 }
 
-TEST_F(OutputQueueTest, AllIsDroppedWhenThePeerIsGone) {
+TEST_F(OutputQueueTest, AllIsDroppedWhenThePeerHasDisconnected) {
   append("one");
   append("two");
   theirs_.reset();

@@ -112,7 +112,7 @@ TEST_F(ProcessTest, PassedDescriptorThatDoesNotListenIsRefused) {
   EXPECT_EQ(service.waitForExit(), statusFor(ConnectionOpenError::Kind::kBadActivation));
 }
 
-TEST_F(ProcessTest, ManagerIsToldWhenItServes) {
+TEST_F(ProcessTest, ManagerIsNotifiedWhenItServes) {
   const path notifyPath = directory_.path() / "notify";
   const UniqueFd notify(socket(AF_UNIX, SOCK_DGRAM, 0));
   sockaddr_un address{};

@@ -25,7 +25,7 @@ TEST(RequestsTest, PeerThatSaysNoHelloIsAnswered) {
   EXPECT_EQ(client.call("echo", "hello").text, "hello");
 }
 
-TEST(RequestsTest, InterfaceMayBeLeftOut) {
+TEST(RequestsTest, InterfaceIsOptional) {
   const ServiceUnderTest service;
   BusClient client(service.address());
 
@@ -128,7 +128,7 @@ TEST(RequestsTest, RequestsWhoseRepliesAreHeldBackDoNotCountAsOpen) {
   }
 }
 
-TEST(RequestsTest, RepliesToAClientThatIsGoneAreDropped) {
+TEST(RequestsTest, RepliesToAClientThatHasDisconnectedAreDropped) {
   ServiceUnderTest service;
   const std::array argument = {Value(std::int64_t{1})};
   {

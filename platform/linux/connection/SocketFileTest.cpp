@@ -53,7 +53,7 @@ TEST_F(SocketFileTest, OnlyThoseMayConnectWhomTheModeLetsIn) {
   EXPECT_EQ(static_cast<unsigned>(permissions) & 0777U, 0640U);
 }
 
-TEST_F(SocketFileTest, UnknownGroupIsToldAndNoFileIsLeft) {
+TEST_F(SocketFileTest, UnknownGroupIsAnErrorAndNoFileIsLeft) {
   const auto result = listenOn(socketPath(), {.mode = 0660, .group = "no such group"});
 
   EXPECT_EQ(kindOf(result), Kind::kUnknownGroup);
@@ -138,11 +138,11 @@ TEST_F(SocketFileTest, OtherFileIsLeftAlone) {
   EXPECT_TRUE(std::filesystem::is_regular_file(socketPath()));
 }
 
-TEST_F(SocketFileTest, MissingDirectoryIsTold) {
+TEST_F(SocketFileTest, MissingDirectoryIsAnError) {
   EXPECT_EQ(kindOf(listenOn(directory_.path() / "missing" / "s")), Kind::kDirectoryMissing);
 }
 
-TEST_F(SocketFileTest, DirectoryThatCannotBeWrittenIsTold) {
+TEST_F(SocketFileTest, DirectoryThatCannotBeWrittenIsAnError) {
   std::filesystem::permissions(directory_.path(), std::filesystem::perms(0555));
 
   // In a process of its own, which gives up the rights of the administrator first.
@@ -161,7 +161,7 @@ TEST_F(SocketFileTest, DirectoryThatCannotBeWrittenIsTold) {
   EXPECT_EQ(status, 0);
 }
 
-TEST_F(SocketFileTest, PathThatNoAddressHoldsIsTold) {
+TEST_F(SocketFileTest, PathThatIsTooLongForAnAddressIsAnError) {
   EXPECT_EQ(kindOf(listenOn(directory_.path() / std::string(200, 'a'))), Kind::kPathTooLong);
   EXPECT_EQ(kindOf(listenOn("")), Kind::kPathTooLong);
 }

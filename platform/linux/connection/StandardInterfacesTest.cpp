@@ -121,7 +121,7 @@ TEST(StandardInterfacesTest, ServiceOwnsItsNameOnItsOwnSocket) {
             "org.freedesktop.DBus.Error.NameHasNoOwner");
 }
 
-TEST(StandardInterfacesTest, MatchesAreTakenAndIdIsTold) {
+TEST(StandardInterfacesTest, MatchesAreAcceptedAndIdIsAnswered) {
   const ServiceUnderTest service;
   BusClient client(service.address());
 

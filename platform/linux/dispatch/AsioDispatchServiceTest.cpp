@@ -313,7 +313,7 @@ TEST_F(AsioDispatchWaitTest, AWaitThatEndedWakesNobodyWhenItsTimeOutWouldHaveCom
   EXPECT_TRUE(staysQuiet(wakeUps, 2 * kTimeOut));
 }
 
-TEST_F(AsioDispatchWaitTest, StopDropsWaitsWithTheJobsBehindThemAndCountsThem) {
+TEST_F(AsioDispatchWaitTest, StopDropsWaitsWithTheJobsAfterThemAndCountsThem) {
   for (const auto timeout : {std::optional<std::chrono::nanoseconds>(), {std::chrono::hours(1)}}) {
     AsioDispatchService service(*log_, statistics_);
     const std::uint64_t before = count("jobs discarded at the stop");

@@ -242,7 +242,7 @@ TEST_F(HelpingTest, JobsOfOtherThreadsDoNotWaitForTheEndOfABatch) {
   EXPECT_EQ(threads.size(), 2U);
 }
 
-TEST_F(HelpingTest, ThreadThatEndsWithinABatchLeavesNoJobBehind) {
+TEST_F(HelpingTest, ThreadThatEndsWithinABatchForgetsNoJob) {
   const auto queue = createQueue();
   std::promise<void> ran;
 
@@ -264,8 +264,8 @@ TEST_F(HelpingTest, QueueDroppedWithinABatchRunsItsJobs) {
   EXPECT_EQ(ran.get_future().wait_for(kTestDeadline), std::future_status::ready);
 }
 
-// What one queue of the trial below saw. Not atomic: touched by its jobs only, so that the thread
-// sanitizer tells of any two at once.
+// What one queue of the trial below saw. Only its jobs touch it. It is not atomic, so that
+// ThreadSanitizer reports two jobs that run at once.
 struct Record {
   static constexpr std::size_t kAdders = 6;
   std::array<int, kAdders> last{};

@@ -30,7 +30,7 @@ TEST(DriverSamplesTest, SimpleChannelsAreSubtracted) {
               ElementsAre("-/Tx/-/frames  = 42"));
 }
 
-TEST(DriverSamplesTest, AChannelThatAppearedIsLeftOut) {
+TEST(DriverSamplesTest, AChannelThatAppearedIsNotInTheDifference) {
   const auto old = simpleChannel("Tx", "old");
   const auto appeared = simpleChannel("Tx", "new");
 
@@ -38,7 +38,7 @@ TEST(DriverSamplesTest, AChannelThatAppearedIsLeftOut) {
               ElementsAre("-/Tx/-/old  = 2"));
 }
 
-TEST(DriverSamplesTest, AChannelThatVanishedIsLeftOut) {
+TEST(DriverSamplesTest, AChannelThatVanishedIsNotInTheDifference) {
   const auto gone = simpleChannel("Tx", "gone");
 
   EXPECT_THAT(deltaOf(makeReading({gone}, {1}), makeReading({}, {})), IsEmpty());

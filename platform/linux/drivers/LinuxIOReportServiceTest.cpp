@@ -202,7 +202,7 @@ TEST_F(LinuxIOReportServiceTest, AReadingThatWasBegunBeforeIsNotUsedAndTheNextOn
   EXPECT_EQ(readings.begun(), before + 2);
 }
 
-TEST_F(LinuxIOReportServiceTest, ASlowSourceIsLeftOutAndTheOthersAreNot) {
+TEST_F(LinuxIOReportServiceTest, ASlowSourceIsSkippedAndTheOthersAreNot) {
   longestWait_ = 200ms;
   const auto slow = simpleChannel("Tx", "slow");
   const auto fast = simpleChannel("Tx", "fast");
@@ -221,7 +221,7 @@ TEST_F(LinuxIOReportServiceTest, ASlowSourceIsLeftOutAndTheOthersAreNot) {
   EXPECT_THAT(show(samples), ElementsAre("-/Tx/-/fast  = 2"));
 }
 
-TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndTheLogTellsItOnce) {
+TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndItIsLoggedOnce) {
   longestWait_ = SourceReader::kLongestWait;
   serve([&] {
     gate_.pass();

@@ -63,7 +63,7 @@ TEST(LogMemoryTest, KeepsOnlyTheNewestLines) {
   EXPECT_EQ(memory.contents().added, 5U);
 }
 
-TEST(LogMemoryTest, KeepsTenThousandLinesUnlessToldOtherwise) {
+TEST(LogMemoryTest, KeepsTenThousandLinesByDefault) {
   LogMemory memory(LogLevel::kInfo);
   const std::string line(200, 'a');
 

@@ -156,7 +156,7 @@ TEST_F(QueuedLogServiceTest, ErrorsFindRoomWhenOtherLinesDoNot) {
   EXPECT_THAT(sink.lines(), ::testing::Contains("it broke"));
 }
 
-TEST_F(QueuedLogServiceTest, LossIsToldOnceThereIsRoom) {
+TEST_F(QueuedLogServiceTest, LossIsLoggedOnceThereIsRoom) {
   MemoryLogSink& sink = makeWithMemory();
   sink.hold();
   category_->write(LogLevel::kInfo, "first");

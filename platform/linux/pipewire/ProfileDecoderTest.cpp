@@ -107,7 +107,7 @@ TEST_F(ProfileDecoderTest, ANodeThatWasNeverWokenHasNoTimes) {
   EXPECT_EQ(cycles[0].followers, std::vector<ProfiledNode>{{.id = 40}});
 }
 
-TEST_F(ProfileDecoderTest, FollowersWhoseTurnItWasNotAreLeftOut) {
+TEST_F(ProfileDecoderTest, FollowersWhoseTurnItWasNotAreSkipped) {
   const auto cycles = decodeProfile(makeProfile({{.followers = {{40, 0}, {41, 4}, {42, -1}}}}));
 
   ASSERT_EQ(cycles.size(), 1U);
@@ -123,7 +123,7 @@ TEST_F(ProfileDecoderTest, ACycleHasTheCountOfXrunsOfItsDriver) {
   EXPECT_EQ(cycles[1].driverXruns, 8U);
 }
 
-TEST_F(ProfileDecoderTest, CyclesOfAnImplausibleLengthAreLeftOut) {
+TEST_F(ProfileDecoderTest, CyclesOfAnImplausibleLengthAreSkipped) {
   const auto cycles = decodeProfile(makeProfile({{.duration = 0},
                                                  {.duration = -5},
                                                  {.rate = {1, 0}},
@@ -140,7 +140,7 @@ TEST_F(ProfileDecoderTest, WhatIsNoProfileHasNoCycles) {
   EXPECT_TRUE(decodeProfile(reinterpret_cast<const spa_pod*>(buffer_.data())).empty());
 }
 
-TEST_F(ProfileDecoderTest, BlocksOfOtherShapesAreLeftOut) {
+TEST_F(ProfileDecoderTest, BlocksOfOtherShapesAreSkipped) {
   spa_pod_frame outer{};
   spa_pod_frame inner{};
   spa_pod_builder_push_struct(&builder_, &outer);

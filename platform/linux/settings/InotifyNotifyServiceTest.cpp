@@ -191,7 +191,7 @@ TEST_F(InotifyNotifyServiceTest, ASaveThatChangesNoValuePostsNothing) {
   EXPECT_EQ(postsOf([this] { write(domainFile(kDomain), "# note\na  =  1\n"); }), 0);
 }
 
-TEST_F(InotifyNotifyServiceTest, ABrokenFilePostsNothingUntilItIsMendedWithOtherValues) {
+TEST_F(InotifyNotifyServiceTest, ABrokenFilePostsNothingUntilItIsFixedWithOtherValues) {
   begin();
   write(domainFile(kDomain), "a = 1");
   ASSERT_TRUE(waitForPosts(name_, 1));
@@ -258,7 +258,7 @@ TEST_F(InotifyNotifyServiceTest, AllDirectoriesOnTheWayMayGoAndComeBack) {
   EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);
 }
 
-TEST_F(InotifyNotifyServiceTest, AFileBehindALinkIsFollowed) {
+TEST_F(InotifyNotifyServiceTest, TheTargetOfALinkIsWatched) {
   const auto file = domainFile(kDomain);
   const auto real = scratch_ / "elsewhere" / "settings";
   write(real, "a = 1");

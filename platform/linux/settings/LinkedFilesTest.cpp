@@ -22,7 +22,7 @@ TEST_F(LinkedFilesTest, PathsWithoutLinksDependOnNothingElse) {
   EXPECT_THAT(linkedFiles(scratch_ / "missing" / "file"), IsEmpty());
 }
 
-TEST_F(LinkedFilesTest, EachLinkAndTheFileBehindThemIsGivenInOrder) {
+TEST_F(LinkedFilesTest, ReturnsEachLinkAndThenItsTargetInOrder) {
   std::filesystem::create_directory(scratch_ / "real");
   std::filesystem::create_symlink("second", scratch_ / "first");
   std::filesystem::create_symlink(scratch_ / "real" / ".." / "real" / "file", scratch_ / "second");

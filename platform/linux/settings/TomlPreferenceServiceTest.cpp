@@ -116,7 +116,7 @@ n = 1
   EXPECT_EQ(at("array"), Value(Array{Dictionary{{"n", 1}}, Dictionary{}}));
 }
 
-TEST_F(TomlPreferenceServiceTest, NamesThatLeaveTheDirectoryAreRefusedAndToldOnce) {
+TEST_F(TomlPreferenceServiceTest, NamesThatLeaveTheDirectoryAreRefusedAndLoggedOnce) {
   write(scratch_ / "secret.toml", "key = 1");
   for (int turn = 0; turn < 3; ++turn) {
     EXPECT_EQ(at("key", "../secret", "."), std::nullopt);
@@ -130,7 +130,7 @@ TEST_F(TomlPreferenceServiceTest, NamesThatLeaveTheDirectoryAreRefusedAndToldOnc
   EXPECT_EQ(linesWith("user \"..\", domain \"secret\": expected names that a file can have"), 1U);
 }
 
-TEST_F(TomlPreferenceServiceTest, ABrokenFileIsToldOnceWithItsPlaceAndCountsAsAbsent) {
+TEST_F(TomlPreferenceServiceTest, ABrokenFileIsLoggedOnceWithItsPlaceAndCountsAsAbsent) {
   store("key = 1\nother = \n");
 
   EXPECT_EQ(at("key"), std::nullopt);
@@ -141,7 +141,7 @@ TEST_F(TomlPreferenceServiceTest, ABrokenFileIsToldOnceWithItsPlaceAndCountsAsAb
   EXPECT_EQ(linesWith(domainFile("domain").native() + ":2:"), 1U);
 }
 
-TEST_F(TomlPreferenceServiceTest, AMendedFileWorksAgainAndIsToldOnce) {
+TEST_F(TomlPreferenceServiceTest, AFixedFileWorksAgainAndIsLoggedOnce) {
   store("key =");
   EXPECT_EQ(at("key"), std::nullopt);
   store("key = 1");
@@ -165,7 +165,7 @@ TEST_F(TomlPreferenceServiceTest, AFileThatIsTooLargeIsNotRead) {
   EXPECT_EQ(at("key"), Value(1));
 }
 
-TEST_F(TomlPreferenceServiceTest, APipeOrADirectoryInItsPlaceIsToldAndBlocksNobody) {
+TEST_F(TomlPreferenceServiceTest, APipeOrADirectoryInItsPlaceIsLoggedAndBlocksNobody) {
   std::filesystem::create_directories(preferences() / "mobile");
   ASSERT_EQ(::mkfifo(domainFile("domain").c_str(), 0600), 0);
   EXPECT_EQ(at("key"), std::nullopt);

@@ -64,7 +64,7 @@ TEST_F(StoreOpeningTest, RefusesAStoreThatAnotherServiceWrites) {
   EXPECT_THAT(error->description, HasSubstr("another service"));
 }
 
-TEST_F(StoreOpeningTest, TakesTheStoreOverOnceTheOtherServiceIsGone) {
+TEST_F(StoreOpeningTest, TakesTheStoreOverOnceTheOtherServiceHasEnded) {
   start();
   stop();
   start();

@@ -45,7 +45,7 @@ class JsonResultsFileServiceTest : public testing::Test {
   JsonResultsFileService service_{root_, platform_.statistics};
 };
 
-TEST_F(JsonResultsFileServiceTest, FileTellsProductVersionUnitAndValuesByName) {
+TEST_F(JsonResultsFileServiceTest, FileHasProductVersionUnitAndValuesByName) {
   auto writer = open();
   ASSERT_NE(writer, nullptr);
   add(writer, "second", 2.5);

@@ -37,7 +37,7 @@ WireBytes numberField(WireBytes fields, std::uint8_t code, std::uint32_t number)
   return fields.align(8).u8(code).signature("u").u32(number);
 }
 
-TEST(FrameMeasureTest, WrongFirstBytesAreToldAsSoonAsTheyAreThere) {
+TEST(FrameMeasureTest, WrongFirstBytesAreReportedAsSoonAsTheyArrive) {
   EXPECT_EQ(measureFrame(asBytes("x"), kNoLimit).state, State::kBroken);
   EXPECT_EQ(measureFrame(asBytes({"l\0", 2}), kNoLimit).state, State::kBroken);
   EXPECT_EQ(measureFrame(asBytes({"l\1\0\2", 4}), kNoLimit).state, State::kBroken);
@@ -77,7 +77,7 @@ TEST(FrameTest, SerialOfZeroIsRefused) {
   EXPECT_EQ(errorOf(frameOf(1, callFields(""), "", 0)), "the serial number must not be 0");
 }
 
-TEST(FrameTest, BytesBehindTheFrameAreRefused) {
+TEST(FrameTest, BytesAfterTheFrameAreRefused) {
   EXPECT_EQ(errorOf(frameOf(1, callFields(""), "") + "x"),
             "the frame has another size than its header says");
 }
@@ -207,7 +207,7 @@ TEST(FrameTest, PaddingThatIsNotZeroIsRefused) {
   EXPECT_EQ(errorOf(behindFields), "the padding after the header is not zero");
 }
 
-TEST(FrameTest, ErrorTellsTheByte) {
+TEST(FrameTest, ErrorNamesTheByte) {
   const auto result = readFrame(asBytes(frameOf(1, textField(callFields(""), 6, "s", "x"), "")));
 
   ASSERT_TRUE(std::holds_alternative<WireError>(result));

@@ -39,7 +39,7 @@ void expectMalformed(const char* what, std::string_view signature, const WireByt
   EXPECT_NE(error->message, "");
 }
 
-TEST(ValueDecoderTest, OtherSignaturesThanTheExpectedOneAreToldApart) {
+TEST(ValueDecoderTest, OtherSignaturesThanTheExpectedOneAreAnErrorOfTheirOwn) {
   Values arguments;
 
   const auto error = decodeBody(bodyFrame("x", WireBytes().u64(1)), "qx", arguments);
@@ -70,7 +70,7 @@ TEST(ValueDecoderTest, UnsupportedValuesAreNamedWithKeyAndSignature) {
             "(signature \"h\")");
 }
 
-TEST(ValueDecoderTest, PathOfKeysAndElementsIsTold) {
+TEST(ValueDecoderTest, PathOfKeysAndElementsIsReported) {
   // u, then {"a": {"b": [1, 2, 3, (4)]}}
   WireBytes array;
   for (int i = 0; i < 3; ++i) array.signature("y").u8(1);
@@ -241,7 +241,7 @@ TEST(ValueDecoderTest, OddBytesInBrokenSignaturesAreEscaped) {
   EXPECT_EQ(error->signature, "\\xff\\x0a\\\"");
 }
 
-TEST(ValueDecoderTest, ErrorLeavesNothingBehindForTheNextMessage) {
+TEST(ValueDecoderTest, ErrorLeavesNothingForTheNextMessage) {
   const WireBytes entry = entryOf("k", "h", std::string(4, '\0'));
   ASSERT_TRUE(errorOf("a{sv}", entry).has_value());
 

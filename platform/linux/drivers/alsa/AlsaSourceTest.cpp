@@ -77,7 +77,7 @@ TEST_F(AlsaSourceTest, AnAnalogueCodecHasPlaybackCaptureAndPower) {
                   "suspended:0:1840"));
 }
 
-TEST_F(AlsaSourceTest, DevicesOfOneNameOnAUsbCardAreToldApart) {
+TEST_F(AlsaSourceTest, DevicesOfOneNameOnAUsbCardAreDistinguished) {
   use("usb");
 
   EXPECT_THAT(
@@ -170,7 +170,7 @@ TEST_F(AlsaSourceTest, RuntimePowerIsTakenFromTheKernelsOwnCount) {
             "HDA ATI HDMI/StateTransitionTimes_ms/Runtime/power ms = active:1:500 suspended:0:500");
 }
 
-TEST_F(AlsaSourceTest, WhatVanishesIsLeftOutAndTheRestStays) {
+TEST_F(AlsaSourceTest, WhatVanishesIsSkippedAndTheRestStays) {
   use("analogue");
   static_cast<void>(source_.read());
 
@@ -198,7 +198,7 @@ TEST_F(AlsaSourceTest, ACardThatIsPluggedInAgainIsAnother) {
 }
 
 // A dangling link is in its directory and cannot be opened.
-TEST_F(AlsaSourceTest, WhatIsGoneWhenItsDirectoryHasBeenListedIsLeftOut) {
+TEST_F(AlsaSourceTest, WhatVanishesAfterItsDirectoryWasListedIsSkipped) {
   use("analogue");
   const auto asound = root_.path() / "proc/asound";
   const auto before = show();
@@ -210,7 +210,7 @@ TEST_F(AlsaSourceTest, WhatIsGoneWhenItsDirectoryHasBeenListedIsLeftOut) {
   EXPECT_EQ(show(), before);
 }
 
-TEST_F(AlsaSourceTest, TwoCardsOfOneNameAreToldApart) {
+TEST_F(AlsaSourceTest, TwoCardsOfOneNameAreDistinguished) {
   use("usb");
   addTwinOfUsbCard();
 

@@ -88,7 +88,7 @@ TEST_F(GraphStatisticsTest, ACycleCountsForItsDriverAndForEachFollower) {
   EXPECT_THAT(read("microphone/Rx/PipeWire/wait"), ElementsAre(EndsWith("min 0 max 50")));
 }
 
-TEST_F(GraphStatisticsTest, ACycleThatIsToldTwiceCountsOnceWithItsXruns) {
+TEST_F(GraphStatisticsTest, ACycleThatIsReportedTwiceCountsOnceWithItsXruns) {
   graph.nodeAdded(30, "Audio/Sink", "speakers");
   graph.nodeAdded(40, "Audio/Sink", "more");
   ProfiledCycle missed = cycle(2s);
@@ -129,7 +129,7 @@ TEST_F(GraphStatisticsTest, ACountOfXrunsThatWentBackCountsNone) {
   EXPECT_THAT(read("speakers"), Contains(EndsWith("/xruns  = 0")));
 }
 
-TEST_F(GraphStatisticsTest, CyclesOfNodesThatAreNeitherSinkNorSourceAreLeftOut) {
+TEST_F(GraphStatisticsTest, CyclesOfNodesThatAreNeitherSinkNorSourceAreIgnored) {
   graph.nodeAdded(40, "Audio/Sink", "speakers");
 
   graph.cycleEnded(cycle(1s));
@@ -148,7 +148,7 @@ TEST_F(GraphStatisticsTest, StatesGatherTimeUntilTheReading) {
               ElementsAre("speakers/Speaker/PipeWire/state us = running:1:3000000 idle:0:1000000"));
 }
 
-TEST_F(GraphStatisticsTest, TheSecondNodeOfANameHasItsNumberBehindIt) {
+TEST_F(GraphStatisticsTest, TheSecondNodeOfANameHasItsNumberAppended) {
   graph.nodeAdded(30, "Audio/Sink", "twin");
   graph.nodeAdded(31, "Audio/Sink", "twin");
   graph.nodeAdded(32, "Audio/Source", "twin");
@@ -160,7 +160,7 @@ TEST_F(GraphStatisticsTest, TheSecondNodeOfANameHasItsNumberBehindIt) {
 
 // The keys of a report contain no blanks and no underscores, and nothing of a driver's name from
 // its first "<" on.
-TEST_F(GraphStatisticsTest, NamesThatAReportCannotTellApartHaveTheirNumbersToo) {
+TEST_F(GraphStatisticsTest, NamesThatAReportCannotDistinguishHaveTheirNumbersToo) {
   graph.nodeAdded(30, "Audio/Sink", "usb_out");
   graph.nodeAdded(31, "Audio/Sink", "usb out");
   graph.nodeAdded(32, "Audio/Sink", "amp<1>");
@@ -170,7 +170,7 @@ TEST_F(GraphStatisticsTest, NamesThatAReportCannotTellApartHaveTheirNumbersToo) 
   EXPECT_THAT(read("amp#33<2>/"), Contains(EndsWith("/cycles  = 0")));
 }
 
-TEST_F(GraphStatisticsTest, ANumberBehindANameIsNoOtherNodesNameEither) {
+TEST_F(GraphStatisticsTest, AnAppendedNumberDoesNotMakeAnotherNodesName) {
   graph.nodeAdded(30, "Audio/Sink", "twin#32");
   graph.nodeAdded(31, "Audio/Sink", "twin");
   graph.nodeAdded(32, "Audio/Sink", "twin");
@@ -216,7 +216,7 @@ TEST_F(GraphStatisticsTest, ANodeOfAnotherGroupIsNoSuccessor) {
   EXPECT_THAT(read("both"), Contains(EndsWith("/cycles  = 0")));
 }
 
-TEST_F(GraphStatisticsTest, ANodeThatIsGoneIsInNoState) {
+TEST_F(GraphStatisticsTest, ANodeThatVanishedIsInNoState) {
   graph.nodeAdded(30, "Audio/Sink", "speakers");
   graph.nodeStateChanged(30, NodeState::kIdle, now);
   now += 2s;
@@ -231,7 +231,7 @@ TEST_F(GraphStatisticsTest, ANodeThatIsGoneIsInNoState) {
               ElementsAre("speakers/Speaker/PipeWire/state us = idle:0:5000000"));
 }
 
-TEST_F(GraphStatisticsTest, OfNodesThatAreGoneTheMostIsKept) {
+TEST_F(GraphStatisticsTest, VanishedNodesAreKeptUpToTheLimit) {
   for (std::uint32_t id = 0; id <= GraphStatistics::kMostNodes; ++id) {
     ASSERT_TRUE(graph.nodeAdded(id, "Audio/Sink", "node" + std::to_string(id)));
     graph.cycleEnded({.time = 1s, .length = 10ms, .driver = ProfiledNode{.id = id}});
@@ -271,7 +271,7 @@ TEST_F(GraphStatisticsTest, NamesAreCutAndCleaned) {
   EXPECT_THAT(read("\xef\xbf\xbd!"), Contains(EndsWith("cycles  = 0")));
 }
 
-TEST_F(GraphStatisticsTest, NodesBeyondTheMostAreLeftOut) {
+TEST_F(GraphStatisticsTest, NodesBeyondTheLimitAreIgnored) {
   for (std::uint32_t id = 0; id < GraphStatistics::kMostNodes; ++id) {
     ASSERT_TRUE(graph.nodeAdded(id, "Audio/Sink", std::to_string(id)));
   }

@@ -34,13 +34,13 @@ class ServerWatchTest : public ::testing::Test {
   ~ServerWatchTest() override { unsetenv("PIPEWIRE_REMOTE"); }
 
   // The number of calls so far.
-  int told() {
+  int reports() {
     while (pw_loop_iterate(loop.get(), 0) > 0) {
     }
-    return told_;
+    return reports_;
   }
   [[nodiscard]] ServerWatch makeWatch() {
-    return {loop.get(), [this] { ++told_; }};
+    return {loop.get(), [this] { ++reports_; }};
   }
   [[nodiscard]] std::filesystem::path inDirectory(std::string_view name) const {
     return directory.path() / name;
@@ -51,27 +51,27 @@ class ServerWatchTest : public ::testing::Test {
   std::unique_ptr<pw_loop, LoopDeleter> loop;
 
  private:
-  int told_ = 0;
+  int reports_ = 0;
 };
 
-TEST_F(ServerWatchTest, TellsOfTheSocketsNameAndOfNoOther) {
+TEST_F(ServerWatchTest, ReportsTheSocketsNameAndNoOther) {
   ServerWatch watch = makeWatch();
   watch.begin();
 
   create(inDirectory("pipewire-0.lock"));
-  EXPECT_EQ(told(), 0);
+  EXPECT_EQ(reports(), 0);
   create(inDirectory("pipewire-0"));
-  EXPECT_EQ(told(), 1);
+  EXPECT_EQ(reports(), 1);
 }
 
-TEST_F(ServerWatchTest, TellsOfANameThatWasMovedIn) {
+TEST_F(ServerWatchTest, ReportsANameThatWasMovedIn) {
   create(inDirectory("elsewhere"));
   ServerWatch watch = makeWatch();
   watch.begin();
 
   std::filesystem::rename(inDirectory("elsewhere"), inDirectory("pipewire-0"));
 
-  EXPECT_EQ(told(), 1);
+  EXPECT_EQ(reports(), 1);
 }
 
 TEST_F(ServerWatchTest, AnAbsoluteNameIsWatchedWhereItIs) {
@@ -81,22 +81,22 @@ TEST_F(ServerWatchTest, AnAbsoluteNameIsWatchedWhereItIs) {
   watch.begin();
 
   create(inDirectory("audio"));
-  EXPECT_EQ(told(), 0);
+  EXPECT_EQ(reports(), 0);
   create(other.path() / "audio");
-  EXPECT_GE(told(), 1);
+  EXPECT_GE(reports(), 1);
 }
 
-TEST_F(ServerWatchTest, TellsNothingAfterItsEndAndAgainAfterAnotherBeginning) {
+TEST_F(ServerWatchTest, ReportsNothingAfterItsEndAndAgainAfterAnotherBeginning) {
   ServerWatch watch = makeWatch();
   watch.begin();
   watch.end();
   create(inDirectory("pipewire-0"));
-  EXPECT_EQ(told(), 0);
+  EXPECT_EQ(reports(), 0);
 
   std::filesystem::remove(inDirectory("pipewire-0"));
   watch.begin();
   create(inDirectory("pipewire-0"));
-  EXPECT_EQ(told(), 1);
+  EXPECT_EQ(reports(), 1);
 }
 
 TEST_F(ServerWatchTest, ADirectoryThatIsMissingIsFoundAtTheNextBeginning) {
@@ -105,12 +105,12 @@ TEST_F(ServerWatchTest, ADirectoryThatIsMissingIsFoundAtTheNextBeginning) {
   watch.begin();
   std::filesystem::create_directory(inDirectory("missing"));
   create(inDirectory("missing") / "other");
-  EXPECT_EQ(told(), 0);
+  EXPECT_EQ(reports(), 0);
 
   watch.end();
   watch.begin();
   create(inDirectory("missing") / "pipewire-0");
-  EXPECT_EQ(told(), 1);
+  EXPECT_EQ(reports(), 1);
 }
 
 TEST_F(ServerWatchTest, ADirectoryThatGoesEndsItsWatchQuietly) {
@@ -121,7 +121,7 @@ TEST_F(ServerWatchTest, ADirectoryThatGoesEndsItsWatchQuietly) {
   watch.begin();
 
   std::filesystem::remove(gone);
-  EXPECT_EQ(told(), 0);
+  EXPECT_EQ(reports(), 0);
   // Nothing remains that would wake the loop.
   EXPECT_EQ(pw_loop_iterate(loop.get(), 0), 0);
 
@@ -129,7 +129,7 @@ TEST_F(ServerWatchTest, ADirectoryThatGoesEndsItsWatchQuietly) {
   watch.end();
   watch.begin();
   create(gone / "pipewire-0");
-  EXPECT_EQ(told(), 1);
+  EXPECT_EQ(reports(), 1);
 }
 
 }  // namespace

@@ -83,7 +83,7 @@ TEST(MetricChannelsTest, AStateSetWithItsCountersIsAStateChannel) {
               ElementsAre("-/TarnoQ7AMP/-/amp ms = on:3:900 off:2:100"));
 }
 
-TEST(MetricChannelsTest, WhatIsNoChannelIsLeftOut) {
+TEST(MetricChannelsTest, MetricsThatAreNotChannelsAreSkipped) {
   EXPECT_THAT(channelsOf("untold 3\n"
                          "# TYPE rpc summary\nrpc{quantile=\"0.5\"} 3\nrpc_sum 3\n"
                          "# TYPE mode stateset\nmode{mode=\"a\"} 1\n"

@@ -72,7 +72,7 @@ TEST_F(TextfileSourceTest, AFileThatIsWrittenInPlaceIsNoticedEvenWithinOneTick) 
   }
 }
 
-TEST_F(TextfileSourceTest, FilesForWhichNoRoomIsLeftAreLeftOutUntilThereIs) {
+TEST_F(TextfileSourceTest, FilesBeyondTheRoomAreSkippedUntilThereIsRoom) {
   // Each is as large as a file may be, so that all of them together use up the room.
   for (int number = 0; number < 8; ++number) {
     const std::string name = "level" + std::to_string(number);
@@ -97,7 +97,7 @@ TEST_F(TextfileSourceTest, FilesForWhichNoRoomIsLeftAreLeftOutUntilThereIs) {
   EXPECT_THAT(show(), ::testing::Contains("-/Haptics/-/pulses  = 3"));
 }
 
-TEST_F(TextfileSourceTest, AWrongFileIsLeftOutAndNamedOnceWithItsLine) {
+TEST_F(TextfileSourceTest, AWrongFileIsSkippedAndLoggedOnceWithItsLine) {
   writePulses("a.prom", 3);
   write("b.prom", "# TYPE x counter\nx_total -1\n");
 
@@ -131,7 +131,7 @@ TEST_F(TextfileSourceTest, AChannelSurvivesItsFileBeingHalfWritten) {
               ElementsAre("-/Haptics/-/pulses  = 7"));
 }
 
-TEST_F(TextfileSourceTest, ADeletedFilesChannelsAreGoneAndNewOnesWhenTheyComeBack) {
+TEST_F(TextfileSourceTest, ChannelsOfADeletedFileVanishAndAreNewWhenTheyReturn) {
   writePulses("a.prom", 3);
   const auto before = source_.read();
   std::filesystem::remove(directory_.path() / "a.prom");

@@ -9,9 +9,9 @@ namespace {
 
 struct Flushed {
   AckLedger::Done done() {
-    return [this](const AckTally& told) {
+    return [this](const AckTally& reported) {
       ++times;
-      tally = told;
+      tally = reported;
     };
   }
   int times = 0;
@@ -43,7 +43,7 @@ TEST(AckLedgerTest, FlushEndsWithTheLastOutcome) {
   EXPECT_EQ(flushed.tally, (AckTally{1, 1}));
 }
 
-TEST(AckLedgerTest, FlushTellsOutcomesThatCameBeforeIt) {
+TEST(AckLedgerTest, FlushReportsOutcomesThatCameBeforeIt) {
   AckLedger ledger;
   ledger.resolve(ledger.add(), AckOutcome::kAcknowledged);
   ledger.resolve(ledger.add(), AckOutcome::kFailed);

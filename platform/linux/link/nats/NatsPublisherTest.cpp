@@ -26,7 +26,7 @@ class NatsPublisherTest : public testing::Test {
   // The tally of a flush of all messages so far; none if it still waits.
   std::optional<AckTally> flushed() {
     std::optional<AckTally> tally;
-    ledger_->flush([&tally](const AckTally& told) { tally = told; });
+    ledger_->flush([&tally](const AckTally& reported) { tally = reported; });
     return tally;
   }
 

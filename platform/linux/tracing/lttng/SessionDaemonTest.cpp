@@ -108,14 +108,14 @@ class SessionDaemonTest : public testing::Test {
                          .endsWithin = std::chrono::milliseconds(100)}};
 };
 
-TEST_F(SessionDaemonTest, ProgramThatIsMissingIsTold) {
+TEST_F(SessionDaemonTest, MissingProgramIsAnError) {
   EXPECT_EQ(daemon_.start(kOwnSessions), "cannot start lttng-sessiond: No such file or directory");
 
   EXPECT_FALSE(daemon_.isOurs());
   EXPECT_FALSE(daemon_.isNoted());
 }
 
-TEST_F(SessionDaemonTest, DaemonThatEndsAtOnceIsToldBeforeTheTimeIsUp) {
+TEST_F(SessionDaemonTest, DaemonThatEndsAtOnceIsReportedBeforeTheTimeLimit) {
   writeProgram("exit 1");
   SessionDaemon patient(note_, {.answersWithin = std::chrono::hours(1)});
 
@@ -125,7 +125,7 @@ TEST_F(SessionDaemonTest, DaemonThatEndsAtOnceIsToldBeforeTheTimeIsUp) {
   EXPECT_FALSE(patient.isNoted());
 }
 
-TEST_F(SessionDaemonTest, DaemonThatDoesNotAnswerIsEndedAndTold) {
+TEST_F(SessionDaemonTest, DaemonThatDoesNotAnswerIsEndedAndReported) {
   writeProgram("exec /bin/sleep 1000");
 
   EXPECT_EQ(daemon_.start(kOwnSessions), "lttng-sessiond does not answer");

@@ -60,7 +60,7 @@ TEST_F(TraceArchiveTest, ProcessThatIsKilledLeavesNothingBesideTheFinishedArchiv
   EXPECT_TRUE(isEmpty(archives_));
 }
 
-TEST_F(TraceArchiveTest, FileThatCannotBeWrittenIsToldAndLeavesNothing) {
+TEST_F(TraceArchiveTest, FileThatCannotBeWrittenIsAnErrorAndLeavesNothing) {
   const auto fail = [this] {
     std::signal(SIGXFSZ, SIG_IGN);
     limitFiles();
@@ -74,7 +74,7 @@ TEST_F(TraceArchiveTest, FileThatCannotBeWrittenIsToldAndLeavesNothing) {
   EXPECT_EQ(std::distance(fs::directory_iterator(directory_.parent_path()), {}), 1);
 }
 
-TEST_F(TraceArchiveTest, DirectoryThatIsMissingIsTold) {
+TEST_F(TraceArchiveTest, MissingDirectoryIsAnError) {
   EXPECT_NE(packDirectory(scratch_.path() / "recordings/none", archive_), std::nullopt);
 
   EXPECT_TRUE(isEmpty(archives_));
