@@ -37,7 +37,7 @@ class DescriptorSources {
 
  private:
   int sourceOf(int ours) {
-    // Above all numbers of the child's, so nothing can replace it.
+    // A number above all that the child uses: setting those up cannot replace this descriptor.
     if (ours == ChildProgram::Descriptor::kNull || ours > largest_) return ours;
     UniqueFd& copy = copies_.emplace_back(::fcntl(ours, F_DUPFD_CLOEXEC, largest_ + 1));
     if (!copy) error_ = errno;

@@ -23,15 +23,15 @@ struct ChildProgram {
   };
   // Which descriptors the child has besides those in `descriptors`.
   enum class OtherDescriptors : std::uint8_t {
-    kWithoutCloseOnExec,  // those that are not to be closed on exec, the standard streams included
+    kWithoutCloseOnExec,  // those without the close-on-exec flag, including the standard streams
     kClosed               // none above the largest number in `descriptors`
   };
   // What the child is a member of. A group of its own lets one signal reach all that it starts. A
   // session of its own also keeps the signals of our terminal away from it.
   enum class Group : std::uint8_t { kOurs, kOwnGroup, kOwnSession };
-  // This program's threads block all signals and ignore some, and another program that inherits
-  // this may not end when it should. Inherit them only to hand on what our own caller set, such as
-  // nohup.
+  // Threads of this program block all signals, and the program ignores some. A child that inherits
+  // this may not end when it should. kInherited is only for passing on what the caller of this
+  // program set, as nohup does.
   enum class Signals : std::uint8_t { kReset, kInherited };
 
   std::vector<std::string> command;  // the program is searched for in PATH unless it has a slash
@@ -40,7 +40,7 @@ struct ChildProgram {
   OtherDescriptors otherDescriptors = OtherDescriptors::kWithoutCloseOnExec;
   Group group = Group::kOurs;
   Signals signals = Signals::kReset;
-  std::vector<int> blockedSignals{};  // of reset ones, those that the child starts with blocked
+  std::vector<int> blockedSignals{};  // with kReset: blocked when the child starts
 };
 
 // How a child process ended.
@@ -78,8 +78,8 @@ class ChildProcess {
   // Owned by this object; -1 if the process had no free descriptor.
   [[nodiscard]] int descriptor() const { return descriptor_.get(); }
 
-  // Sends a signal to the child, or to all in its group if it has one of its own. Does nothing
-  // after the end.
+  // signal() sends a signal to the child. signalGroup() sends it to all processes of the child's
+  // group, if it has a group of its own, and else to the child. Both do nothing after the end.
   void signal(int number) const;
   void signalGroup(int number) const;
 

@@ -23,8 +23,8 @@ void setUpThread(std::string_view label, ThreadPriority priority);
 
 // Blocks all signals for the calling thread while it lives. A thread inherits the signal mask of
 // the one that creates it, so one that is created meanwhile never takes a signal, not even before
-// setUpThread(). A library needs this where it creates a thread in a program of others; in our own
-// programs the main thread handles the signals of a thread that has just begun as well.
+// setUpThread(). A library needs this when it creates a thread in another program: that program's
+// signals must go to its own threads.
 class SignalsBlocked {
  public:
   SignalsBlocked();

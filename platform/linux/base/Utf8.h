@@ -37,7 +37,7 @@ struct Utf8Step {
 }
 
 // Returns the longest beginning of `text` that has at most `most` bytes and does not end within a
-// character. If `text` is not valid, invalid bytes near the cut may go too.
+// character. If `text` is not valid, invalid bytes near the cut may be removed, too.
 [[nodiscard]] std::string_view utf8Prefix(std::string_view text, std::size_t most);
 
 // Returns `text` with each byte that is not part of valid UTF-8 replaced by U+FFFD.

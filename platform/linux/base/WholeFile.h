@@ -13,8 +13,8 @@ namespace halvox::platform::linux_ {
 
 // Which file to read, and how.
 struct FileToRead {
-  // Regular files only, unless another program may hand the text over by a pipe: opening a device
-  // may do something, and reading a pipe waits for whoever writes to it.
+  // kRegular, unless the text may come through a pipe. Opening a device may have an effect, and
+  // reading a pipe waits for its writer.
   enum class Kinds : std::uint8_t { kRegular, kAny };
   // Whether a symbolic link in the last component of the path is followed.
   enum class Links : std::uint8_t { kFollowed, kRefused };
@@ -35,7 +35,7 @@ struct FileContent {
     kRead,        // `bytes` is the whole file
     kMissing,     // there is no such file, or no directory on the way to it
     kNotRegular,  // a directory, pipe, socket or device; `mode` says which
-    kTooLarge,    // more than `most` bytes; `bytes` has the first of them if they were to be cut
+    kTooLarge,    // more than `most` bytes; `bytes` has the first `most` with Excess::kCut
     kFailed,      // `bytes` has what was read before the error
   };
 
@@ -51,10 +51,9 @@ struct FileContent {
 };
 
 // Reads a small file in one piece. Blocks on the disk. With Kinds::kRegular it never waits for
-// another process; with Kinds::kAny it waits for the end of what a pipe's writer writes, but
-// opening a pipe that has no writer does not block and reads an empty text. Does not rely on the
-// file's size, so it reads the files of /proc as well as a file that grows meanwhile. Any thread
-// may call it.
+// another process. With Kinds::kAny it reads a pipe until the writer closes it; a pipe without a
+// writer gives an empty text. Does not rely on the file's size, which is 0 for files of /proc and
+// may grow meanwhile. Any thread may call it.
 [[nodiscard]] FileContent readWholeFile(const FileToRead& file);
 
 // Returns a directory to read files below, or an empty handle, with errno set, if it cannot be

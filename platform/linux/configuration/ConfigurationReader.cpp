@@ -35,6 +35,7 @@ std::string found(const toml::node& node) {
 }
 
 std::size_t editDistance(std::string_view left, std::string_view right) {
+  // One row of the usual table is enough: each number depends on this row and the one before.
   std::vector<std::size_t> row(right.size() + 1);
   std::iota(row.begin(), row.end(), std::size_t{0});
   for (std::size_t i = 0; i < left.size(); ++i) {
@@ -58,6 +59,7 @@ std::string_view closest(std::string_view key, const std::vector<std::string>& k
 }
 
 std::optional<Date> toDate(const toml::date_time& time) {
+  // Without an offset, the moment would depend on the time zone of the machine.
   if (!time.offset.has_value()) return std::nullopt;
   const std::chrono::year_month_day day{std::chrono::year(time.date.year),
                                         std::chrono::month(time.date.month),
@@ -74,6 +76,7 @@ std::optional<Date> toDate(const toml::date_time& time) {
 }  // namespace
 
 void ConfigurationMistakes::add(const toml::source_position& where, std::string_view what) {
+  // The checks run in the order of the code, and users fix a file from its top.
   if (first_.has_value() && !(where < firstPosition_)) return;
   std::string line;
   appendEscaped(line, fmt::format("{}:{}:{}: {}", file_, where.line, where.column, what),
@@ -110,6 +113,7 @@ void TableReader::read(std::string_view key, std::vector<std::string>& result) {
   if (node == nullptr) return;
   const toml::array* array = node->as_array();
   if (array == nullptr) return expected(*node, key, kExpected);
+  // Collected apart: after a mistake, `result` still has its default.
   std::vector<std::string> texts;
   for (const toml::node& element : *array) {
     const auto* text = element.as_string();
@@ -239,6 +243,7 @@ void TableReader::finish() {
 }
 
 const toml::node* TableReader::find(std::string_view key) {
+  // Noted even if the file does not have the key: an unknown key is compared with all of them.
   known_.emplace_back(key);
   return table_ == nullptr ? nullptr : table_->get(key);
 }

@@ -44,9 +44,9 @@ struct NumberRange {
 };
 
 // One table of the file. Every read names its key, so that finish() can report the keys that nobody
-// read. A read leaves `result` unchanged, which holds the default, if the key is absent; and also
-// if the value is not as expected, which it adds as a mistake. Refers to the parsed file and to
-// `mistakes`, which must outlive it. Belongs to one thread.
+// read. `result` holds the default before a read. A read leaves it unchanged if the key is absent.
+// It also does if the value is not as expected, and adds a mistake. Refers to the parsed file and
+// to `mistakes`, which must outlive it. Belongs to one thread.
 class TableReader {
  public:
   // `table` is null for a table that the file does not have. `name` is empty for the root.

@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The device properties that the configuration file sets. Immutable, hence for any thread. Owner:
+// The device properties that the configuration file sets. Immutable. Any thread may call. Owned by
 // the platform.
 class ConfiguredDevicePropertyService final : public DevicePropertyService {
  public:

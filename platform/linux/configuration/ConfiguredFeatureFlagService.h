@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The feature switches that the configuration file sets. Immutable, hence for any thread. Owner:
+// The feature switches that the configuration file sets. Immutable. Any thread may call. Owned by
 // the platform.
 class ConfiguredFeatureFlagService final : public FeatureFlagService {
  public:

@@ -39,7 +39,7 @@ class BusConnection final : private StreamOwner {
   // Releases all senders without calling their handlers, because the service ends.
   void abandon();
 
-  // For senders. A sender that waits is told when the stream has room again.
+  // For senders. A sender that waits continues when the stream has room again.
   [[nodiscard]] SocketStream& stream() { return stream_; }
   void forget(const BusSender& sender);
   void noteWaitingSender() { someSenderWaits_ = true; }

@@ -53,6 +53,8 @@ BusConnector::BusConnector(std::string busName)
     : busName_(std::move(busName)), input_(dbus::kMaxMessageBytes) {}
 
 std::variant<BusSession, ConnectionOpenError> BusConnector::connect(const std::string& address) {
+  // One deadline for all steps: a bus that answers each of them slowly must not hold up the start
+  // either.
   deadline_ = std::chrono::steady_clock::now() + kBusTimeout;
   if (Failure failure = connectToFirst(address)) return *std::move(failure);
   if (Failure failure = authenticate()) return *std::move(failure);
@@ -71,6 +73,8 @@ std::variant<BusSession, ConnectionOpenError> BusConnector::connect(const std::s
 BusConnector::Failure BusConnector::connectToFirst(const std::string& address) {
   address_ = address;
   std::string reasons;
+  // An address may list several sockets, of which the first that accepts is the bus. All reasons
+  // are in the error, because any of them may be the cause.
   for (const BusSocket& socket : parseBusAddress(address)) {
     std::variant<UniqueFd, int> result = connectTo(socket);
     if (auto* fd = std::get_if<UniqueFd>(&result); fd != nullptr) {
@@ -116,7 +120,7 @@ BusConnector::Failure BusConnector::requestName() {
     return ConnectionOpenError{.kind = Kind::kBusNameTaken,
                                .description = "bus " + address_ +
                                               ": another process owns the name " + busName_ +
-                                              "; stop it, or leave this bus out of listener.bus"};
+                                              "; stop it or change listener.bus"};
   });
 }
 

@@ -24,7 +24,7 @@ std::string uniqueNameOf(const ClientConnection& client) {
   return ":1." + std::to_string(client.number());
 }
 
-// The unique name behind a name, or none when nobody has it.
+// The unique name of the owner of a name; none if it has no owner.
 std::optional<std::string> ownerOf(const StandardRequest& request, std::string_view name) {
   if (name == request.identity.busName || name == kOwnUniqueName) {
     return std::string(kOwnUniqueName);
@@ -36,10 +36,12 @@ std::optional<std::string> ownerOf(const StandardRequest& request, std::string_v
 
 StandardAnswer nobodyHas(std::string_view name) {
   return {.errorName = error_names::kNameHasNoOwner,
-          .errorText = "nobody has the name \"" + std::string(name) + "\""};
+          .errorText = "the name \"" + std::string(name) + "\" has no owner"};
 }
 
 StandardAnswer hello(const StandardRequest& request) {
+  // D-Bus allows one Hello for each connection. Libraries send it without asking whether there is a
+  // bus.
   if (request.client.takeHello()) return {.value = Value(uniqueNameOf(request.client))};
   return {.errorName = error_names::kFailed, .errorText = "the connection has its name already"};
 }
@@ -59,6 +61,7 @@ StandardAnswer nameHasOwner(const StandardRequest& request) {
 
 StandardAnswer startServiceByName(const StandardRequest& request) {
   const std::string_view name = request.arguments[0].string();
+  // GLib's proxies ask the bus to start the service before they call it.
   if (ownerOf(request, name).has_value()) return {.value = Value(kServiceAlreadyRunning)};
   return {.errorName = error_names::kServiceUnknown,
           .errorText = "there is no service \"" + std::string(name) + "\""};
@@ -82,6 +85,7 @@ StandardAnswer getConnectionUnixProcessId(const StandardRequest& request) {
   const std::optional<std::string> owner = ownerOf(request, name);
   if (!owner.has_value()) return nobodyHas(name);
   const bool isClient = *owner == uniqueNameOf(request.client);
+  // All other names that have an owner are the service's own.
   return {.value = Value(static_cast<std::uint32_t>(isClient ? request.client.processIdentifier()
                                                              : getpid()))};
 }

@@ -55,8 +55,8 @@ void ClientConnection::deliver() {
   if (state_ == State::kNotResumed) setReading(false);
   if (state_ == State::kNotResumed || state_ == State::kEnded) return input().settle();
   state_ = State::kReading;
-  // While the store is behind, a client that has more than a short share waits until the store has
-  // caught up. Clients that send little are not slowed down.
+  // While too much waits for the store, a client that has more than a short share waits until the
+  // store has caught up. Clients that send little are not slowed down.
   const bool pressed = host_.backpressure().isHigh();
   std::size_t requestsLeft = pressed ? kShortTurnRequests : host_.turn().requestsPerClient();
   std::size_t bytes = 0;
@@ -66,9 +66,8 @@ void ClientConnection::deliver() {
       onDelivered(next.state == FrameBuffer::State::kPartial, bytes > 0);
       break;
     }
-    // Only with a frame at hand: a client that asks for nothing more need not be held back. Before
-    // the share, because a client that is due would be looked at in every turn although it must
-    // wait.
+    // Only with a whole frame: a client without a request need not be held back. Before the share,
+    // because a client that is due would be looked at in every turn although it must wait.
     if (mustWait()) break;
     // Looks at what was delivered before this frame, so that a frame larger than a whole share is
     // delivered too.

@@ -18,8 +18,7 @@ void ReplyTicket::answer(const std::shared_ptr<ReplyTicket>& ticket,
   statistics.repliesGiven.add();
   if (ticket->answered_.exchange(true, std::memory_order_relaxed)) {
     statistics.repliesDroppedSecond.add();
-    kLog.debug("dropped a second reply to request ", ticket->serial_,
-               ": the wire has room for one");
+    kLog.debug("dropped a second reply to request ", ticket->serial_, ": D-Bus allows only one");
     return;
   }
   Inbox& inbox = ticket->client_->inbox();

@@ -37,9 +37,8 @@ struct PeerCredentials;
 //   3. calls the handlers of connections that have ended
 //   4. ends the batch: this thread now runs the brief jobs that it queued (docs/decisions/0002)
 //   5. reads the mail of other threads
-//   6. writes: one system call for each connection with output, so all replies of the turn, those
-//   of
-//      helped jobs and of mail included, leave together
+//   6. writes: one system call for each connection with output. All replies of the turn leave
+//      together, including those of helped jobs and of mail
 //   7. wakes the pool for the queues that the jobs used
 //
 // The thread that calls resume() is the I/O thread, to which this belongs. Any thread may call

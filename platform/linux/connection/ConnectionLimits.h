@@ -34,8 +34,9 @@ inline constexpr std::size_t kReadBytes = 64 * kKiB;
 // A client's share of one turn. What exceeds it waits until the other clients had theirs.
 inline constexpr std::size_t kTurnRequests = 64;
 inline constexpr std::size_t kTurnBytes = 64 * kKiB;
-// The share when more than kFewClients clients have requests, and while the store is behind: a turn
-// must not grow with the number of clients, since every reply of a turn waits for its end.
+// The share when more than kFewClients clients have requests, and while too much waits for the
+// store. A turn must not grow with the number of clients, since every reply of a turn waits for its
+// end.
 inline constexpr std::size_t kShortTurnRequests = 16;
 inline constexpr std::size_t kFewClients = 4;
 

@@ -25,7 +25,8 @@ class FlowControl {
 
   void open(Cost cost) { open_.fetch_add(packed(cost), std::memory_order_relaxed); }
 
-  // True when the reader waits and has room again. The caller must then wake it; only one is told.
+  // True when the reader waits and has room again. The caller must then wake it. Of several
+  // callers, only one gets true.
   [[nodiscard]] bool close(Cost cost) {
     // Sequentially consistent with wait(): whichever of the two comes second sees what the first
     // did, so the reader cannot sleep for ever.

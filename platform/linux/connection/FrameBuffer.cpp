@@ -86,7 +86,7 @@ FrameBuffer::Next FrameBuffer::next() const {
     return next;
   }
   // With the limit of D-Bus and not ours: a frame between the two is answered with an error and
-  // skipped, and the connection goes on.
+  // skipped, and the connection continues.
   dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);
   next.state = State::kPartial;
   if (measure.state == dbus::FrameMeasure::State::kNeedMoreBytes) return next;

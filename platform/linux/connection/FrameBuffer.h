@@ -53,11 +53,11 @@ class FrameBuffer {
   FrameBuffer(const FrameBuffer&) = delete;
   FrameBuffer& operator=(const FrameBuffer&) = delete;
 
-  // Where the next read goes; tell received() how much came, also when nothing did. Until settle()
-  // nobody else may use the scratch.
+  // Where the next read goes. Call received() after it, also when nothing came. Nothing else may
+  // use the scratch before settle().
   [[nodiscard]] std::span<std::byte> readInto(const ReadScratch& scratch);
   void received(std::size_t count);
-  // Moves what is left out of the scratch, and gives storage back that is not needed any more.
+  // Moves the remaining bytes out of the scratch, and frees storage that is not needed any more.
   void settle();
 
   // Adds bytes from elsewhere. Not between readInto() and settle().

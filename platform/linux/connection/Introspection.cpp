@@ -41,6 +41,7 @@ void openInterface(std::string& xml, std::string_view name) {
 void appendStandardInterfaces(std::string& xml, bool isObject) {
   std::string_view open;
   for (const StandardMethod& method : objectMethods()) {
+    // Parents of the object have no properties, but can be pinged and introspected.
     if (method.scope == StandardScope::kObject && !isObject) continue;
     if (method.interface != open) {
       if (!open.empty()) xml += " </interface>\n";

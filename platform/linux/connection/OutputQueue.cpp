@@ -51,6 +51,7 @@ std::size_t OutputQueue::unsentBytes() const {
 }
 
 OutputQueue::Flush OutputQueue::flush(int fd, std::size_t& sentBytes, std::size_t& droppedFrames) {
+  // Everything may have been dropped since the flush was asked for.
   if (unsentBytes() == 0) {
     clear();
     return Flush::kEmpty;
@@ -91,6 +92,7 @@ void OutputQueue::noteSent(std::size_t count) {
   buffer.bytes.erase(0, cut);
   buffer.frameEnds.erase(buffer.frameEnds.begin(),
                          buffer.frameEnds.begin() + static_cast<std::ptrdiff_t>(buffer.sentFrames));
+  // The ends count from the start of the buffer, which has moved.
   for (std::size_t& end : buffer.frameEnds) end -= cut;
   buffer.sentBytes = 0;
   buffer.sentFrames = 0;

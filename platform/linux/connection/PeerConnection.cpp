@@ -32,7 +32,7 @@ std::string PeerConnection::description() const {
 void PeerConnection::setReading(bool reading) {
   // A client that is held back cannot finish its message, so this is not its fault.
   if (!reading) deadline_.stop();
-  // The handshake goes on while the delegate has not accepted the client yet.
+  // The handshake continues while the delegate has not accepted the client yet.
   stream_.setReading(reading || handshake_ != nullptr);
 }
 

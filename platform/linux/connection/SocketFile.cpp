@@ -68,14 +68,16 @@ ConnectionOpenError bindFailure(const std::filesystem::path& path, int error) {
   switch (error) {
     case ENOENT:
     case ENOTDIR:
-      return failure(Kind::kDirectoryMissing, path, "its directory does not exist");
+      return failure(Kind::kDirectoryMissing, path,
+                     "its directory does not exist; create it or set listener.socket");
     case EACCES:
     case EROFS:
     case EPERM:
       return failure(Kind::kDirectoryNotWritable, path,
                      "cannot write to its directory: " + errnoText(error));
     case EADDRINUSE:
-      return failure(Kind::kAlreadyServed, path, "another process has just made it");
+      return failure(Kind::kAlreadyServed, path,
+                     "another process has created it meanwhile; stop it or set listener.socket");
     default:
       return failure(Kind::kSystem, path, errnoText(error));
   }

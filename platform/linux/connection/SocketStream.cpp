@@ -46,7 +46,7 @@ void SocketStream::setReading(bool reading) {
 }
 
 void SocketStream::outputAdded() {
-  // While the socket is full, the loop tells us when it has room.
+  // While the socket is full, a write would fail. The loop reports when the socket has room.
   if (flushing_ || blocked_) return;
   flushing_ = true;
   host_.turn().flushLater(*this);

@@ -32,10 +32,15 @@ StandardAnswer unknownProperty(const StandardRequest& request) {
                        "\"; the object has none"};
 }
 
+// GLib's proxies ask for all properties when they are made. The object has none, which is a valid
+// answer.
 StandardAnswer noProperties(const StandardRequest& /*request*/) {
   return {.value = Value(Dictionary{})};
 }
 
+// Methods of one interface stand together: the introspection opens each interface once.
+//
+// Peer is everywhere, because D-Bus defines it for every path, whether or not an object is there.
 constexpr std::array kObjectMethods = {
     StandardMethod{kPeer, "Ping", "", "", StandardScope::kEverywhere, ping},
     StandardMethod{kPeer, "GetMachineId", "", "s", StandardScope::kEverywhere, getMachineId},
@@ -53,6 +58,7 @@ bool isExportedObject(const ClientConnection& client, std::string_view path) {
 bool isInTree(const ClientConnection& client, std::string_view path) {
   const NSXPCInterface* exported = client.exportedInterface();
   if (exported == nullptr || client.exportedObject() == nullptr) return false;
+  // Tools find the object by asking its parents, from the root down.
   return path == exported->objectPath || isParentPath(path, exported->objectPath);
 }
 
@@ -102,11 +108,14 @@ bool isParentPath(std::string_view path, std::string_view objectPath) {
 const StandardMethod* StandardInterfaces::find(const ClientConnection& client,
                                                const dbus::MessageHeader& request) const {
   const StandardMethod* method = findIn(kObjectMethods, client, request);
+  // Last: on a real bus these methods belong to the bus, and none of them is in scope.
   return method != nullptr ? method : findIn(busMethods(), client, request);
 }
 
 UnknownPart StandardInterfaces::unknownPartOf(const ClientConnection& client,
                                               const dbus::MessageHeader& request) const {
+  // In this order, from the method to the object: a client that has the interface right should
+  // learn that only the method is wrong.
   const bool isOwnInterface = isExportedObject(client, request.path) &&
                               request.interface == client.exportedInterface()->name;
   if (isOwnInterface || isInterfaceOf(kObjectMethods, client, request) ||

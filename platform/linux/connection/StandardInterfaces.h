@@ -69,7 +69,8 @@ class StandardInterfaces {
   // The standard method that a request asks for, or null.
   [[nodiscard]] const StandardMethod* find(const ClientConnection& client,
                                            const dbus::MessageHeader& request) const;
-  // What is unknown in a request that neither find() nor the exported object knows.
+  // Which part of a request is unknown. Only for requests that neither find() nor the exported
+  // object knows.
   [[nodiscard]] UnknownPart unknownPartOf(const ClientConnection& client,
                                           const dbus::MessageHeader& request) const;
   [[nodiscard]] const ServiceIdentity& identity() const { return identity_; }
@@ -78,7 +79,7 @@ class StandardInterfaces {
   const ServiceIdentity& identity_;
 };
 
-// True when `path` is a parent of `objectPath`, the root included.
+// True when `path` is a parent of `objectPath`. The root is a parent of all others.
 bool isParentPath(std::string_view path, std::string_view objectPath);
 
 }  // namespace halvox::platform::linux_

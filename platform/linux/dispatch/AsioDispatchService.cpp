@@ -81,7 +81,8 @@ bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
 }
 
 void AsioDispatchService::logStuck(const std::vector<std::string>& labels) {
-  std::string text = "jobs still run at the end of the time to stop; ending without them. Queues:";
+  std::string text =
+      "jobs did not end within the time limit of the stop; ending without them. Queues:";
   for (const std::string& label : labels) text += " \"" + label + "\"";
   if (labels.empty()) text += " the background queue";
   log_.write(LogLevel::kError, detail::logPrefix("AsioDispatchService", __LINE__) + text);

@@ -19,8 +19,8 @@ class DispatchPool;
 // Jobs that run after a delay: any number of them, with one kernel timer and without a thread.
 //
 // The timer is always set for the earliest job and for nothing else. A wait that ends before its
-// time-out therefore leaves no wake-up behind; Asio's own timers would. The pool's utility threads
-// watch the timer, because background jobs, which may take long, must not delay it.
+// time-out therefore causes no wake-up later. With Asio's own timers it did. The pool's utility
+// threads watch the timer, because background jobs, which may take long, must not delay it.
 //
 // Owned by the pool. Any thread may add jobs. Due jobs run on the pool's threads of their quality,
 // in no order with others. The number of jobs has no bound: what waits is charged to clients. No

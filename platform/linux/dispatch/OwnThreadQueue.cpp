@@ -131,7 +131,7 @@ void OwnThreadQueue::runNextInBatch(DispatchThread& thread) {
   runNext();
 }
 
-// Discards what a stop left in the batch, and reports the end of the thread.
+// Discards the jobs that a stop left in the batch, and reports the end of the thread.
 void OwnThreadQueue::end() {
   if (next_ < batch_.size()) runner_->countDiscarded(batch_.size() - next_);
   batch_.clear();

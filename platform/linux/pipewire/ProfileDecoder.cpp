@@ -10,13 +10,13 @@
 namespace halvox::pipewire {
 namespace {
 
-// The stages of a node's work in a cycle, as the profiler tells them. A node that was not even
-// called waits for another one, and that one is late.
+// The stages of a node's work in a cycle, as the profiler numbers them. A node that was not even
+// called is not late itself: it waits for another node that is.
 constexpr std::int32_t kCalled = 1;
 constexpr std::int32_t kAwake = 2;
 constexpr std::int32_t kFinished = 3;
 
-// No device works in longer cycles; what claims to is no clock of audio.
+// No device works in longer cycles. A driver that claims a longer one is not a clock of audio.
 constexpr std::chrono::duration<double> kLongestCycle{10};
 
 bool readClock(const spa_pod& value, ProfiledCycle& cycle) {
@@ -77,7 +77,8 @@ void addFollower(const ReadNode& read, ProfiledCycle& cycle) {
   if (read.stage < kFinished) cycle.late.push_back(read.node.id);
 }
 
-// Of the figures that stand for the load, only the count of xruns, the last one.
+// Reads the count of xruns, which is the last of the figures about the load. The others are not
+// used.
 std::uint32_t readXruns(const spa_pod& value) {
   std::int64_t counter = 0;
   float fast = 0;

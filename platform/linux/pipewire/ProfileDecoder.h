@@ -17,7 +17,7 @@ struct ProfiledNode {
   friend bool operator==(const ProfiledNode&, const ProfiledNode&) = default;
 };
 
-// What PipeWire's profiler tells of one cycle of a driver, as far as it is of interest.
+// What PipeWire's profiler reports about one cycle of a driver. Has only the fields that we use.
 struct ProfiledCycle {
   std::chrono::nanoseconds time{};         // of the driver's clock
   std::chrono::duration<double> length{};  // what each node had to produce or take
@@ -30,8 +30,8 @@ struct ProfiledCycle {
   friend bool operator==(const ProfiledCycle&, const ProfiledCycle&) = default;
 };
 
-// The cycles of one event of the profiler, in order; those that cannot be read, or whose clock has
-// no plausible length, are left out.
+// The cycles of one event of the profiler, in order. Skips those that cannot be read or whose clock
+// has no plausible length.
 std::vector<ProfiledCycle> decodeProfile(const spa_pod* profile);
 
 }  // namespace halvox::pipewire

@@ -83,7 +83,7 @@ class AnalyticsRecords final : public RecordKind {
   // Increases when the row numbers of names may be wrong: after a rollback, which may have removed
   // the rows, and after opening a database, which may be another one.
   std::uint64_t generation_ = 1;
-  std::uint64_t written_ = 0;       // events in the open transaction, those too large included
+  std::uint64_t written_ = 0;       // events in the open transaction, including tooLarge_
   std::uint64_t writtenBytes_ = 0;  // the length of their payloads
   std::uint64_t tooLarge_ = 0;      // events among written_ that were dropped for their length
   OncePerSecond tooLargeLines_;

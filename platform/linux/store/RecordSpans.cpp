@@ -39,7 +39,7 @@ SqliteCode RecordSpans::prepare(Database& database) {
             " last_time = max(last_time, excluded.last_time)"},
         {&statements_.oldestRecord, "SELECT id, time FROM $records ORDER BY id LIMIT 1"},
         {&statements_.deleteRecords, "DELETE FROM $records WHERE id BETWEEN ?1 AND ?2"},
-        // Keep the newest span when its records are gone: the next number derives from it.
+        // Keep the newest span when its records are deleted: the next number derives from it.
         {&statements_.deleteEmptySpans,
          "DELETE FROM $spans WHERE span < ?1 AND span < (SELECT max(span) FROM $spans)"},
         {&statements_.agedSpan,
@@ -121,7 +121,7 @@ SqliteCode RecordSpans::deleteOldest(bool& found) {
   statements_.deleteRecords.bind(2, first + kRecordsPerStep - 1);
   code = statements_.deleteRecords.run();
   if (code != SQLITE_OK) return code;
-  // Only spans of which no number is left, so the one that was begun stays.
+  // Only spans whose numbers are all deleted. The span of the next oldest record stays.
   statements_.deleteEmptySpans.bind(1, (first + kRecordsPerStep) / kRecordsPerSpan);
   return statements_.deleteEmptySpans.run();
 }

@@ -57,7 +57,7 @@ SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
 }  // namespace
 
 SqliteCode Retention::prepare(Database& database) {
-  // Not the constant of the opening: a database that others made has pages of its own size.
+  // Asked from SQLite: a database that another program made may have pages of another size.
   pageBytes_ = static_cast<std::uint64_t>(database.queryInteger("PRAGMA page_size").value_or(0));
   // Vacuum writes each page that it moves to the log. Move so few at a time that the log does not
   // outgrow its limit.
@@ -106,8 +106,8 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
 }
 
 bool Retention::isFull() const {
-  // Reserve the payload of one transaction and a quarter for what pages hold beside it. Then the
-  // next transaction fills free pages, and the file does not grow.
+  // Reserve the payload of one transaction, and a quarter more for what pages hold in addition to
+  // payloads. The next transaction then fills free pages, and the file does not grow.
   const std::uint64_t reserve = limits_.transactionBytes + limits_.transactionBytes / 4;
   return (pages_ - freePages_) * pageBytes_ + reserve > limits_.databaseBytes;
 }
@@ -126,7 +126,7 @@ SqliteCode Retention::deleteAged(double now, std::span<RecordKind* const> kinds,
     });
     if (code != SQLITE_OK) return code;
     if (!found) {
-      // Only when nothing was left to delete. Otherwise the next round goes on at once.
+      // Only when nothing remains to be deleted. Otherwise the next round continues at once.
       nextByAge_ = std::chrono::steady_clock::now() + kAgeInterval;
       return SQLITE_OK;
     }

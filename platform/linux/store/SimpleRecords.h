@@ -81,7 +81,7 @@ class SimpleRecordKind : public RecordKind {
   Statement insert_;
   std::size_t taken_ = 0;
   std::size_t next_ = 0;            // the first taken record that is not written yet
-  std::uint64_t written_ = 0;       // records in the open transaction, those too large included
+  std::uint64_t written_ = 0;       // records in the open transaction, including tooLarge_
   std::uint64_t writtenBytes_ = 0;  // the length of their payloads
   std::uint64_t tooLarge_ = 0;      // records among written_ that were dropped for their length
   OncePerSecond tooLargeLines_;

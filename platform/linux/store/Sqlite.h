@@ -86,7 +86,7 @@ class Database {
 
   // Describes the last error: SQLite's text and, if there was one, the system's in parentheses.
   [[nodiscard]] std::string errorText() const;
-  // The errno of the system call behind the last error; 0 when there was none.
+  // The errno of the system call that caused the last error; 0 if none did.
   [[nodiscard]] int systemError() const { return sqlite3_system_errno(handle_.get()); }
   [[nodiscard]] sqlite3* get() const { return handle_.get(); }
 

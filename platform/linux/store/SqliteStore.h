@@ -47,10 +47,10 @@ struct StoreOptions {
 // synced.
 //
 // Failures never reach the callers. When the disk is full, the file is locked, or reading or
-// writing fails, the store drops and counts the records at hand, logs at most one error a second,
-// and tries again with the next records. It creates a file that was deleted. It renames a damaged
-// database, starts a new one, and copies the records of this run into it. A database that the last
-// run did not close is checked in the background.
+// writing fails, the store drops and counts the records being written, logs at most one error a
+// second, and tries again with the next records. It creates a file that was deleted. It renames a
+// damaged database, starts a new one, and copies the records of this run into it. A database that
+// the last run did not close is checked in the background.
 //
 // Owned by the platform. open() and close() belong to one thread.
 class SqliteStore {
@@ -133,7 +133,7 @@ class SqliteStore {
   OncePerSecond failureLines_;
 
   StoreExtent extent_;  // the newest records at the time when the database was opened
-  StoreCheck check_;    // wakes the writer through queue_, which stands above and outlives it
+  StoreCheck check_;    // wakes the writer through queue_, which is declared above and outlives it
   std::thread writer_;
 };
 

@@ -162,8 +162,8 @@ StoreCheck::Outcome StoreCheck::readTable(Database& database, const std::string&
   std::int64_t last = std::numeric_limits<std::int64_t>::min();
   while (code == SQLITE_ROW) {
     const auto begun = Clock::now();
-    // Each slice is a new query that continues after the last row: the transaction of the last one
-    // has ended, and retention may have deleted rows since.
+    // Each slice is a new query that continues after the last row. The transaction of the previous
+    // slice has ended, and retention may have deleted rows since.
     rows.bind(1, last);
     rows.bind(2, newest);
     code = readSlice(rows, last, records_);

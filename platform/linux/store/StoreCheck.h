@@ -40,11 +40,12 @@ class StoreCheck {
   StoreCheck& operator=(const StoreCheck&) = delete;
   ~StoreCheck() { static_cast<void>(stop()); }
 
-  // Stops a running check and starts to check `file`. Without a thread to have, logs an error and
-  // gives up.
+  // Stops a running check and starts to check `file`. If no thread can be started, logs an error
+  // and gives up.
   void begin(const std::string& file, const StoreExtent& extent, OnDamage onDamage);
-  // Ends the thread and forgets its finding. Blocks for at most one slice. Returns false when the
-  // file that it was to check still needs a check; idempotent but for that.
+  // Ends the thread and forgets its finding. Blocks for at most one slice. Returns false if the
+  // file that it was to check still needs a check. A further call returns true and does nothing
+  // else.
   bool stop();
   // Any thread. Describes the damage; std::nullopt while none was found.
   [[nodiscard]] std::optional<std::string> finding() HALVOX_EXCLUDES(mutex_);

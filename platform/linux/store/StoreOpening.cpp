@@ -19,12 +19,12 @@ constexpr std::uint64_t kMegabyte = 1024U * 1024U;
 constexpr std::uint64_t kPageBytes = 8192;
 constexpr std::uint64_t kCacheKibibytes = 1024;
 constexpr std::uint64_t kLargestLog = 4 * kMegabyte;
-// Bounds the time until a record is visible: nothing of a transaction is, before its commit.
+// A record becomes visible with the commit of its transaction. This bounds the time until then.
 constexpr std::uint64_t kLargestTransaction = 2 * kMegabyte;
 // Below the 1,000,000,000 bytes that SQLite accepts for one value.
 constexpr std::uint64_t kLargestPayload = 256 * kMegabyte;
-// How long the writer waits for a lock of another process before it drops the records at hand.
-// Half of the half second within which a stored record must be visible.
+// How long the writer waits for a lock of another process before it drops the records being
+// written. Half of the half second within which a stored record must be visible.
 constexpr std::chrono::milliseconds kBusyTimeout{250};
 
 StoreError failure(StoreError::Kind kind, const StoreFiles& files, const std::string& what) {

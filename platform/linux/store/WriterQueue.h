@@ -33,7 +33,7 @@ struct QueueLimits {
 //
 // The writer sleeps without a timer while nothing waits. The first record wakes it. If its last
 // round was less than `gatherTime` ago, it then sleeps until that time is over or `gatherRecords`
-// wait. A busy service thus commits seldom, and does not wake the writer for every record.
+// wait. This keeps a busy service from committing often and from waking the writer for each record.
 //
 // Owned by the store. Cannot fail.
 class WriterQueue {
@@ -75,7 +75,7 @@ class WriterQueue {
   // and runs `take` only if something is queued.
   bool take(Time notBefore, const std::function<void()>& take) HALVOX_EXCLUDES(mutex_);
   // Writer only. `records` of the taken records were stored or dropped; their payloads had `bytes`.
-  // The queue takes the time since the last take(), finish() or disregardTime() for the time that
+  // The queue counts the time since the last take(), finish() or disregardTime() as the time that
   // they needed.
   void finish(std::uint64_t records, std::uint64_t bytes) HALVOX_EXCLUDES(mutex_);
   // Writer only. The time so far was spent on a failure: finish() must not count it as writing.

@@ -11,8 +11,8 @@ namespace halvox::platform::linux_ {
 std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options,
                                                  StatisticsService& statistics) {
   const std::filesystem::path directory = options.storageDirectory / "traces";
-  // A recording that an earlier run left behind keeps filling the disk until the tracer is told to
-  // end it. Only the module can do that.
+  // A recording of an earlier run keeps filling the disk until its session is destroyed. Only the
+  // module can do that.
   if (options.tracing == Tracing::kDisabled && !hasTraceLeftovers(directory)) {
     return makeNoTraceServices("features.Acoustat.Tracing is not true");
   }

@@ -25,13 +25,13 @@ class TraceServices {
 
   [[nodiscard]] virtual KtraceService& ktrace() = 0;
   [[nodiscard]] virtual PerformanceTraceService& performanceTraces() = 0;
-  // Removes what an earlier service left behind for the same storage directory. Waits for the
-  // tracer only if something was left.
+  // Removes what an earlier service with the same storage directory did not remove. Waits for the
+  // tracer only if there is anything.
   virtual void open() = 0;
   // Lets running traces end soon: from now on nothing waits for a queue. Call it before the queues
   // end.
   virtual void stop() = 0;
-  // Removes everything of ours from the tracer. Call it after the queues have ended.
+  // Removes everything that this service made in the tracer. Call it after the queues have ended.
   virtual void close() = 0;
   // The same if a queue does not end, such as that of a stop that waits for its trace. May wait for
   // an operation of the tracer that is in progress.
@@ -50,8 +50,8 @@ struct TraceOptions {
 // Returns services that record with LTTng. Loads halvox-tracing-lttng.so for them, which brings the
 // libraries of LTTng's control and of babeltrace2. Returns services whose traces cannot be started,
 // and whose description says why, when tracing is disabled or the module cannot be loaded. The
-// module is also loaded when an earlier service left a recording behind, because only it can remove
-// that. The statistics must outlive the services.
+// module is also loaded when an earlier service did not remove a recording, because only the module
+// can. The statistics must outlive the services.
 [[nodiscard]] std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options,
                                                                StatisticsService& statistics);
 

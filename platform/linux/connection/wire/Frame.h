@@ -66,7 +66,7 @@ struct WireError {
   std::size_t offset = 0;
 };
 
-// The size of a frame, as its first bytes tell.
+// The size of a frame, computed from its first bytes.
 struct FrameMeasure {
   enum class State : std::uint8_t {
     kNeedMoreBytes,  // fewer than kFrameStartBytes are there, and these are valid so far

@@ -218,7 +218,7 @@ FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrame
     return broken("the header claims more than 64 MiB of fields", kFieldsLengthOffset);
   }
   const std::uint64_t total = roundedUp(kFrameStartBytes + fieldsBytes) + bodyBytes;
-  // Two limits with two texts: D-Bus allows no message over the first. The second is the caller's.
+  // Apart from the caller's limit below, so that the error names the limit that was exceeded.
   if (total > kMaxMessageBytes) {
     return broken("the header claims a message of " + std::to_string(total) +
                       " bytes, the limit of D-Bus is " + std::to_string(kMaxMessageBytes),

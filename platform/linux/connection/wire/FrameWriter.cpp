@@ -174,6 +174,7 @@ void appendBooleanReply(std::string& out, std::uint32_t replySerial, std::uint32
 
 bool appendMethodReturn(std::string& out, const ReplyTo& replyTo, std::uint32_t serial,
                         std::string_view signature, const Value& value) {
+  // Before anything is appended: on an error, `out` stays as it was.
   if (!isValid(replyTo, serial)) return false;
   if (replyTo.destination.empty() && signature.empty()) {
     appendPlainReply(out, replyTo.serial, serial);

@@ -129,7 +129,7 @@ void ServerHandshake::onLine(std::string_view line, std::string& output) {
   } else if (command == "CANCEL" || command == "ERROR") {
     onCancel(command, output);
   } else if (command == "NEGOTIATE_UNIX_FD" && step_ == Step::kBegin) {
-    // Clients go on without descriptors after this. The service takes none, so it cannot leak any.
+    // Clients continue without descriptors. The service takes none, so it cannot leak any.
     output += "ERROR file descriptors are not taken\r\n";
     countRefusal();
   } else {

@@ -54,9 +54,9 @@ class HandshakeLine {
 //            │▲  AUTH without an identity: data ──DATA──► begin
 //            └┘  anything that is refused
 //
-// Offers EXTERNAL and ANONYMOUS. ANONYMOUS is no less safe, because the kernel has already told who
-// the peer is. Does not agree to pass file descriptors. Belongs to the thread of the connection,
-// which owns it until the handshake is done.
+// Offers EXTERNAL and ANONYMOUS. ANONYMOUS is as safe, because the peer's identity comes from the
+// kernel and not from the handshake. Does not agree to pass file descriptors. Belongs to the thread
+// of the connection, which owns it until the handshake is done.
 class ServerHandshake {
  public:
   // `guidHex` is the identity of the service, 32 hexadecimal digits.

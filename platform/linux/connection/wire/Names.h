@@ -15,7 +15,8 @@ inline constexpr std::size_t kMaxNameBytes = 255;
 [[nodiscard]] bool isInterfaceName(std::string_view text);
 // One such element.
 [[nodiscard]] bool isMemberName(std::string_view text);
-// As an interface, but hyphens are allowed; or ":" and elements that may start with a digit.
+// A well-known name, which may also contain hyphens, or a unique name: ":" and elements that may
+// start with a digit.
 [[nodiscard]] bool isBusName(std::string_view text);
 
 }  // namespace halvox::platform::linux_::dbus

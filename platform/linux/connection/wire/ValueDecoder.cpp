@@ -63,7 +63,7 @@ class Decoder {
 
   WireReader reader_;
   DecodeScratch& scratch_;  // of the caller
-  // What went wrong, and, added on the way out of the containers, where.
+  // What went wrong. `path_` is where: each container adds its step while decoding leaves it.
   bool failed_ = false;
   Kind kind_ = Kind::kMalformed;
   std::string_view problem_;
@@ -158,7 +158,7 @@ Value Decoder::decodeVariant(unsigned level) {
     case SignatureShape::kUnsupported:
       return refuse(Kind::kUnsupported, "values of this type are not supported", type);
     case SignatureShape::kTooDeep:
-      return refuse(Kind::kUnsupported, "the type is nested too deep to be supported", type);
+      return refuse(Kind::kUnsupported, "the type is nested too deeply to be supported", type);
     case SignatureShape::kBroken:
       break;
   }

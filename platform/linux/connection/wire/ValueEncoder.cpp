@@ -13,8 +13,9 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// Arrays nested deeper than this are written as arrays of variants. Finding out whether all
-// elements have one type looks at each element once for each array around it; this bounds that.
+// Arrays nested deeper than this are written as arrays of variants. To find out whether all
+// elements have one type, each element is looked at once for each array around it. This bounds the
+// effort.
 constexpr unsigned kMaxUniformNesting = 8;
 
 template <typename Number>

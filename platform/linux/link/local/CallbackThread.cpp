@@ -17,7 +17,7 @@ void CallbackThread::call(Callback callback) {
       return;
     }
   }
-  // The system has no thread to give. The callback must still not run on the caller's.
+  // The system has no thread to give. The callback must still not run on the caller's thread.
   dispatch_.asyncAfterOnBackgroundQueue(std::chrono::nanoseconds(0), std::move(callback));
 }
 

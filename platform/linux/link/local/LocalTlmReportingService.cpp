@@ -19,6 +19,8 @@ constexpr std::size_t kLongestName = 255;
 std::string nameOf(const Dictionary& info, std::string_view key) {
   const Value* const value = info.find(key);
   if (value == nullptr) return {};
+  // A value that is not a string is kept as text, so that the record still says what the client
+  // sent.
   const std::string name = value->isString() ? std::string(value->string()) : describe(*value);
   return std::string(utf8Prefix(name, kLongestName));
 }

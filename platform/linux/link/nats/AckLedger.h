@@ -33,7 +33,7 @@ class AckLedger {
   using Number = std::uint64_t;
   using FlushId = std::uint64_t;
 
-  // Counts a message in; the caller must resolve the returned number exactly once.
+  // Counts a message as outstanding. The caller must resolve the returned number exactly once.
   [[nodiscard]] Number add() HALVOX_EXCLUDES(mutex_);
   void resolve(Number message, AckOutcome outcome) HALVOX_EXCLUDES(mutex_);
 

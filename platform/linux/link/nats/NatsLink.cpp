@@ -122,7 +122,7 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
 bool NatsLink::close() {
   {
     const MutexLock lock(mutex_);
-    // Called again: the thread that was left behind is still joinable.
+    // Called again. A thread that still hung at the end of the first call is joinable.
     if (closeBy_) return !thread_.joinable();
     const Time now = std::chrono::steady_clock::now();
     closeBy_ = now + kCloseTime;
@@ -211,7 +211,7 @@ bool NatsLink::isAtEnd(Time now) {
 NatsLink::Step NatsLink::nextStep(Time now) {
   // The end before all other steps: close() waits for it with a limit.
   if (isAtEnd(now)) return Step::kEnd;
-  if (!answers_.empty()) return Step::kTell;
+  if (!answers_.empty()) return Step::kCallBack;
   if (state_ == State::kLost) return Step::kDrop;
   // Before connecting, which can take seconds: a flush waits for the messages that are overdue.
   if (const auto deadline = publisher_.firstDeadline(); deadline && now >= *deadline) {
@@ -223,7 +223,7 @@ NatsLink::Step NatsLink::nextStep(Time now) {
   return publisher_.canPublish(now) ? Step::kPublish : Step::kWait;
 }
 
-// When nextStep() can differ although nothing has changed.
+// The time at which nextStep() can return another step although nothing has changed.
 std::optional<NatsLink::Time> NatsLink::nextTime() {
   std::optional<Time> next = closeBy_;
   const auto consider = [&next](std::optional<Time> time) {
@@ -262,8 +262,8 @@ bool NatsLink::perform(Step step) {
   switch (step) {
     case Step::kWait:
       break;
-    case Step::kTell:
-      tellAnswers();
+    case Step::kCallBack:
+      callBackAnswers();
       break;
     case Step::kAnswer:
       answerWaiters();
@@ -314,12 +314,12 @@ void NatsLink::answerWaiters() {
     waiters.swap(waiters_);
     if (state_ == State::kConnected) servers = servers_;
   }
-  tellAnswers();
+  callBackAnswers();
   // Without the lock: a callback may ask or send again.
   for (const Waiter& waiter : waiters) waiter.found(servers);
 }
 
-void NatsLink::tellAnswers() {
+void NatsLink::callBackAnswers() {
   std::vector<Answer> answers;
   {
     const MutexLock lock(mutex_);

@@ -34,8 +34,8 @@ namespace halvox::platform::linux_ {
 //
 // An attempt of the library cannot be cancelled: it holds the lock of its connection object. It can
 // take for ever, because the library sets no time limit for a TLS handshake. close() therefore
-// waits a bounded time. If the thread still hangs then, close() abandons all messages and leaves
-// the thread behind.
+// waits a bounded time. If the thread still hangs then, close() abandons all messages and no longer
+// waits for the thread.
 //
 // Threads: all public functions may be called by any thread; only close() blocks. Locks: this
 // class's lock first, then the publisher's, never the other way round.
@@ -58,20 +58,20 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   NatsLink& operator=(const NatsLink&) = delete;
   ~NatsLink();  // calls close(), if the owner did not
 
-  // Calls `found` exactly once, never before this returns: with the servers' addresses, on the
-  // link's thread, also when a server is connected already; or with nothing, on the background
-  // queue after kDiscoveryTime or on the thread after a failed attempt.
+  // Calls `found` exactly once, and never before this returns. With the servers' addresses it calls
+  // on the link's thread, also when a server is connected already. With nothing it calls on that
+  // thread after a failed attempt, or on the background queue after kDiscoveryTime.
   void discover(TLMReportingService::BackendsCallback found) HALVOX_EXCLUDES(mutex_);
-  // After close(), counts a message as refused and returns the error for its sender; before,
-  // returns none. Call it before creating a message: after close() the library has ended, and
-  // creating a message would crash.
+  // After close(), counts a message as refused and returns the error for its sender. Before
+  // close(), returns none. Call it before creating a message: after close() the library has ended,
+  // and creating a message would crash.
   [[nodiscard]] std::optional<Error> refuseAtEnd() HALVOX_EXCLUDES(mutex_);
   // Queues the message. Returns an error if the service is ending, the message is larger than the
   // server accepts, the queue is full, or an attempt to connect failed within kAttemptPause.
   [[nodiscard]] std::optional<Error> send(OutgoingMessage message) HALVOX_EXCLUDES(mutex_);
   // Publishes queued messages for at most kCloseTime, then ends the connection and the library.
-  // Returns false if the thread was left behind: this object then exists until the process ends,
-  // and so must `environment`. Further calls return the same.
+  // Returns false if the thread still runs: this object then exists until the process ends, and
+  // `environment` must, too. Further calls return the same.
   [[nodiscard]] bool close() HALVOX_EXCLUDES(mutex_);
 
  private:
@@ -89,7 +89,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   enum class State : std::uint8_t { kIdle, kConnecting, kAway, kConnected, kLost };
   enum class Step : std::uint8_t {
     kWait,
-    kTell,
+    kCallBack,
     kAnswer,
     kConnect,
     kPublish,
@@ -115,7 +115,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   void giveUpRest() HALVOX_EXCLUDES(mutex_);
   void keepForEver();
   void answerWaiters() HALVOX_EXCLUDES(mutex_);
-  void tellAnswers() HALVOX_EXCLUDES(mutex_);
+  void callBackAnswers() HALVOX_EXCLUDES(mutex_);
   void expire(std::uint64_t waiter) HALVOX_EXCLUDES(mutex_);
   [[nodiscard]] std::optional<Error> refusal(std::size_t bytes) HALVOX_REQUIRES(mutex_);
 
@@ -140,7 +140,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   bool isIdle_ HALVOX_GUARDED_BY(mutex_) = false;  // the thread waits for a change
   State state_ HALVOX_GUARDED_BY(mutex_) = State::kIdle;
   std::optional<Time> closeBy_ HALVOX_GUARDED_BY(mutex_);  // since close()
-  Time leaveBy_ HALVOX_GUARDED_BY(mutex_){};               // when close() leaves the thread behind
+  Time leaveBy_ HALVOX_GUARDED_BY(mutex_){};  // when close() stops waiting for the thread
   bool hasThreadEnded_ HALVOX_GUARDED_BY(mutex_) = false;
   Time nextAttempt_ HALVOX_GUARDED_BY(mutex_){};
   std::string lastFailure_ HALVOX_GUARDED_BY(mutex_);  // empty when the last attempt succeeded
@@ -151,8 +151,8 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   std::size_t maxPayload_ HALVOX_GUARDED_BY(mutex_) = 0;  // bytes; 0 when not known
   BurstLog attemptLog_ HALVOX_GUARDED_BY(mutex_);
 
-  // Changed by the thread alone, under the lock. Library threads compare the connection with the
-  // one that they report about: one that was dropped may still report.
+  // Changed by the thread alone, under the lock. Threads of the library compare it with the
+  // connection that they report about, which may be one that was dropped.
   NatsConnection connection_;
   JetStreamContext context_;
   std::thread thread_;

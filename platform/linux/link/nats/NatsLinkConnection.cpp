@@ -24,8 +24,9 @@ constexpr std::chrono::milliseconds kWriteTime{2000};
 // Reconnects quickly after a restart of a server; the jitter spreads the services of a fleet.
 constexpr std::chrono::milliseconds kReconnectPause{250};
 constexpr std::chrono::milliseconds kReconnectJitter{250};
-// A server that vanished without closing the connection is noticed within a minute. The wake-ups of
-// shorter pings would cost more than they tell: a missing acknowledgement tells sooner.
+// A server that vanished without closing the connection is noticed within a minute. More frequent
+// pings would wake the service more often and gain little: a missing acknowledgement shows the loss
+// sooner.
 constexpr std::chrono::milliseconds kPingPause{20'000};
 constexpr int kLostPings = 2;
 constexpr int kForEver = -1;
@@ -227,8 +228,8 @@ void NatsLink::onAvailable(natsConnection* connection) {
   const std::int64_t maxPayload = natsConnection_GetMaxPayload(connection);
   const bool isConnected = natsConnection_Status(connection) == NATS_CONN_STATUS_CONNECTED;
   const MutexLock lock(mutex_);
-  // Reports of the library come on threads of its own and can be late: the connection may be
-  // another one, or closed by now.
+  // The library reports on threads of its own, possibly late: the connection may have been replaced
+  // or closed since.
   if (connection != connection_.get() || !isConnected || state_ == State::kLost) return;
   state_ = State::kConnected;
   servers_ = servers;

@@ -212,7 +212,7 @@ void NatsPublisher::probe() {
   {
     const MutexLock lock(mutex_);
     pending_.beginAgain();
-    if (!pending_.hasAgain()) {  // settled, or about to be by a callback
+    if (!pending_.hasAgain()) {  // all are settled, or a callback is settling the last one
       probeAt_ = std::chrono::steady_clock::now() + kResendPause;
       return;
     }
@@ -223,7 +223,7 @@ void NatsPublisher::probe() {
   publish(std::move(messages), kProbeTime);
 }
 
-// Looks for the stream, which may be gone rather than without a leader: both look the same to a
+// Looks for the stream, which may be deleted rather than without a leader: both look the same to a
 // publisher. Not with every probe, see kStreamCheckPause.
 void NatsPublisher::provideStreamAgain() {
   const Time now = std::chrono::steady_clock::now();
@@ -336,7 +336,7 @@ void NatsPublisher::resolve(NatsMessage message, const jsPubAckErr* error) {
     message.reset();
     const bool isProbed = flow_ == Flow::kProbing;
     if (isProbed) flow_ = Flow::kFlowing;
-    // Most acknowledgements wake nobody. These are the ones after which the thread can do more.
+    // Most acknowledgements need not wake the thread. After these it has something to do.
     isAwaited = isProbed || pending_.needsAgain() || (isWindowFull_ && pending_.isHalfFree()) ||
                 (isEnding_ && pending_.size() == 0);
   }
@@ -364,7 +364,8 @@ void NatsPublisher::countFailure(std::uint64_t messages, std::string_view reason
     worthALine = failureLog_.note(messages, std::chrono::steady_clock::now());
   }
   if (worthALine) {
-    kLog.error("messages not delivered to NATS: ", *worthALine, ", reason of the last: ", reason);
+    kLog.error("", *worthALine,
+               " messages were not delivered to NATS; reason of the last: ", reason);
   }
 }
 

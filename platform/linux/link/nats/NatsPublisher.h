@@ -164,7 +164,7 @@ class NatsPublisher {
   BurstLog failureLog_ HALVOX_GUARDED_BY(mutex_);
   BurstLog holdLog_ HALVOX_GUARDED_BY(mutex_);
 
-  // Of the link's thread alone.
+  // Used by the link's thread only.
   jsCtx* context_ = nullptr;
   std::chrono::nanoseconds ackTime_ = kAckTime;
   Time nextStreamCheck_{};

@@ -60,7 +60,8 @@ class NatsTlmReportingService::LinkedSession final : public TLMReportingSession 
   LinkedSession(const std::string& subject, const Dictionary& sessionInfo,
                 const Dictionary& userInfo)
       : id_(sessionIdOf(sessionInfo)) {
-    // Clients set the service name in their configuration, and may set a value that is no string.
+    // Clients set the service name in their configuration, and may set a value that is not a
+    // string.
     const Value* const service = userInfo.find(kTLMReportingUserInfoServiceName);
     const std::string_view name = service == nullptr ? std::string_view() : service->string();
     subject_ = subject + "." + subjectToken(name) + "." + id_;

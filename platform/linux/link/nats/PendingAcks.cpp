@@ -41,7 +41,7 @@ std::optional<PendingAcks::Entry> PendingAcks::take(const natsMsg* message) {
   if (found == atLibrary_.end()) return std::nullopt;
   const std::uint64_t number = found->second;
   atLibrary_.erase(found);
-  // Abandoned as overdue while the library had it. Its slot is gone.
+  // Abandoned as overdue while the library had it. Its slot no longer exists.
   if (number < first_) return std::nullopt;
   Entry entry = settle(slots_[number - first_]);
   skipSettled();

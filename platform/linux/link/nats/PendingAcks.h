@@ -63,7 +63,7 @@ class PendingAcks {
   void beginAgain() { again_ = first_; }
   // Whether messages must be published again before anything new.
   [[nodiscard]] bool needsAgain() const { return again_ < first_ + slots_.size(); }
-  // Whether the next of them is held here. It is not while the library is about to report about it.
+  // Whether the next of them is held here. If it is not, the library will report about it.
   [[nodiscard]] bool hasAgain() const { return needsAgain() && slots_[again_ - first_].held; }
   // Removes and returns the next of them, to be published at once. Call only if hasAgain().
   NatsMessage nextAgain();

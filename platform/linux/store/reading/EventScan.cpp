@@ -14,6 +14,7 @@ constexpr std::int64_t recordOf(StoredRecordID event) { return event / 2; }
 }  // namespace
 
 SqliteCode EventScan::begin() {
+  // That record itself, and not the next: its second event may be newer than `after`.
   bounds_.first = recordOf(filter_.after);
   SqliteCode code = findBounds(database_, "analytics_records", "analytics_spans", filter_, bounds_);
   if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);
@@ -36,6 +37,7 @@ SqliteCode EventScan::skipToNewest(std::uint64_t count) {
   StoredRecordID begin = 2 * (bounds_.last + 1);
   std::uint64_t found = 0;
   while (found < count && (code = statement.step()) == SQLITE_ROW) {
+    // The twin first, because this reads from the newest event back.
     for (const int which : {1, 0}) {
       Event event{};
       if (found >= count || !readEvent(statement, which, event)) continue;
@@ -44,6 +46,7 @@ SqliteCode EventScan::skipToNewest(std::uint64_t count) {
     }
   }
   if (code != SQLITE_OK && code != SQLITE_ROW && code != SQLITE_DONE) return code;
+  // The first record may hold an event that is not among the newest.
   after_ = std::max(after_, begin - 1);
   bounds_.first = recordOf(begin);
   return SQLITE_OK;
@@ -65,6 +68,7 @@ SqliteCode EventScan::next(Piece& piece) {
       Event event{};
       if (!readEvent(read_, which, event)) continue;
       if (!hasPayload) {
+        // Copied once for both events of a record.
         piece.payloads.emplace_back(read_.text(kPayload));
         bytes += piece.payloads.back().size();
         hasPayload = true;

@@ -63,6 +63,7 @@ bool matchesAny(const std::vector<std::string>& patterns, const std::string& nam
 }
 
 SqliteCode RecordScan::begin() {
+  // Record numbers begin with 1.
   bounds_.first = std::max<std::int64_t>(filter_.after + 1, 1);
   SqliteCode code = findBounds(database_, std::string(table_.records), std::string(table_.spans),
                                filter_, bounds_);
@@ -104,16 +105,19 @@ SqliteCode RecordScan::next(std::vector<StoredRecord>& piece) {
   for (int looks = 0; looks < kLooksPerPiece; ++looks) {
     code = read_.step();
     if (code != SQLITE_ROW) break;
+    // Also for a record that does not pass: the next piece must not look at it again.
     bounds_.first = read_.integer(kID) + 1;
     if (passes(read_)) piece.push_back(read(read_, bytes));
     if (piece.size() >= kRecordsPerPiece || bytes >= kBytesPerPiece) break;
   }
+  // Ends the snapshot before the caller's callback runs, which may take as long as it likes.
   read_.reset();
   if (code == SQLITE_DONE) bounds_.first = bounds_.last + 1;
   return code == SQLITE_DONE || code == SQLITE_ROW ? SQLITE_OK : code;
 }
 
 bool RecordScan::passes(const Statement& row) const {
+  // The cheap tests first. The caller's condition needs the whole record, so it comes last.
   if (!isWithinTimes(filter_, row.real(kTime))) return false;
   for (const NumberMatch& match : filter_.numbers) {
     const std::int64_t number = row.integer(columnOf(match.column));

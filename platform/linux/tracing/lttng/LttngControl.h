@@ -31,8 +31,8 @@ struct RecordingPlan {
 // with this prefix that exists at the start was left by an earlier service and can be destroyed.
 //
 // Files: each recording writes into a directory of its own below "scratch" in the traces'
-// directory. While it records, an empty file of its name is in "recording" beside that; whoever
-// sees it knows that events from now on are recorded.
+// directory. While it records, an empty file of its name is in the directory "recording" next to
+// "scratch". From the appearance of that file on, every event is recorded.
 //
 // Threads: any. Each call waits for the daemon, and calls wait for each other, because the control
 // library is not thread-safe. This lock is the only one here that is held during input and output.

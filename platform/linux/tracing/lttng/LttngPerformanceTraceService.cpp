@@ -91,6 +91,7 @@ struct LttngPerformanceTraceService::Work {
 
   // Sets the URL of the trace, or returns why there is none.
   std::optional<Error> save(const LttngControl::Recording& recording, std::string& url) {
+    // The number keeps traces of one second apart.
     const std::string name = kTraceStart + timeText() + "-" + std::to_string(++saves) + kTraceEnd;
     const std::filesystem::path archive = control.tracesDirectory() / name;
     auto failure = packDirectory(recording.directory, archive);
@@ -117,6 +118,7 @@ class LttngTraceSession final : public KQTraceSession,
   ~LttngTraceSession() override {
     if (!recording_.has_value()) return;
     // Nobody holds the session: end the recording and delete it without a call of the delegate.
+    // On the queue and not here: ending a recording waits for the tracer.
     queue_->async(JobWeight::kMayBlock, [work = work_, recording = std::move(*recording_)] {
       work->givenUp.add();
       static_cast<void>(work->end(recording));

@@ -35,10 +35,11 @@ class TracerKeeper {
   TracerKeeper& operator=(const TracerKeeper&) = delete;
   ~TracerKeeper() { release(); }
 
-  // Starts a keeper, which starts a daemon. Returns why there is none, if there is none. Waits
-  // until the daemon has been started, but not until it answers.
+  // Starts a keeper, which starts a daemon. Returns why it could not; std::nullopt on success.
+  // Waits until the daemon has been started, but not until it answers.
   [[nodiscard]] std::optional<std::string> start(const Ward& ward, DaemonProcess& daemon);
-  // Starts a keeper for a daemon that runs already. Returns why there is none, if there is none.
+  // Starts a keeper for a daemon that runs already. Returns why it could not; std::nullopt on
+  // success.
   [[nodiscard]] std::optional<std::string> keep(const Ward& ward, const DaemonProcess& daemon);
   // Waits until no keeper of an earlier service holds the note, at most `within`.
   static void awaitEarlier(const std::filesystem::path& noteFile, std::chrono::milliseconds within);

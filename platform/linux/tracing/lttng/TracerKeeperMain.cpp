@@ -55,7 +55,7 @@ void onSilence(int /*signal*/) {
 
 void say(const std::string& line) {
   const std::string text = line + "\n";
-  // A service that has gone needs no answer. The keeper goes on to clean up after it.
+  // A service that has ended needs no answer. The keeper continues and cleans up after it.
   if (::write(STDOUT_FILENO, text.data(), text.size()) < 0) return;
 }
 
@@ -68,7 +68,8 @@ void awaitEndOfService() {
 }
 
 std::optional<DaemonProcess> startDaemon(std::string& failure) {
-  // A session of its own, as the keeper has: a terminal must not end the daemon first.
+  // Runs in a session of its own, like the keeper: Ctrl-C in a terminal must not end the daemon
+  // before its traces are read.
   auto started = ChildProcess::start({.command = {"lttng-sessiond", "--no-kernel"},
                                       .descriptors = {{.number = STDIN_FILENO},
                                                       {.number = STDOUT_FILENO},
@@ -110,7 +111,8 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
     say(failure);
     return EXIT_FAILURE;
   }
-  // If the note cannot be written, only a service that starts after a killed keeper misses it.
+  // Errors are ignored: the note is needed only by a service that starts after this keeper was
+  // killed.
   static_cast<void>(daemon->write(noteFile));
   // After the note is written: a service that has this answer can be killed, and the next one finds
   // the daemon.
