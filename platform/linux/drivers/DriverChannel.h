@@ -65,7 +65,7 @@ class ChannelList {
 struct Reading {
   std::shared_ptr<const ChannelList> channels;
   std::vector<std::uint64_t> values;
-  // Tells the source that someone still holds one of its readings. May be null.
+  // While it exists, the source knows that a reading is held. May be null.
   std::shared_ptr<void> lease{};
 };
 

@@ -131,6 +131,7 @@ void appendDifference(const ChannelDescription& channel, Numbers previous, Numbe
     isReset |= current[number] < previous[number];
   }
   for (std::size_t number = 0; number < current.size(); ++number) {
+    // After a reset, everything that a counter has counted since belongs to the session.
     differences.push_back(isReset ? current[number] : current[number] - previous[number]);
   }
 }
@@ -154,6 +155,7 @@ std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
     for (const std::uint32_t position : *selection) {
       const ChannelList::Channel& channel = (*now->channels)[position];
       const auto found = before.find(channel.get());
+      // What appeared after the first sample may have counted long before, so it is not reported.
       if (found == before.end()) continue;
       appendDifference(*channel, found->second, valuesOf(*now, position), reading->values);
       channels.push_back(channel);

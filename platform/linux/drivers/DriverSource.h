@@ -27,8 +27,8 @@ class DriverSource {
   // All channels that exist now, and their values. Never null; empty if there are none. What cannot
   // be read is skipped and logged by the source.
   [[nodiscard]] virtual std::shared_ptr<const Reading> read() = 0;
-  // A session has asked for the last reading as a sample; without this call it was only to find out
-  // which channels there are. Called after the reading was handed over: nobody waits for it.
+  // The last reading was a sample of a session. Not called for readings that only find out which
+  // channels exist. Called after the reading was handed over: nobody waits for this call.
   virtual void sampled() {}
 };
 

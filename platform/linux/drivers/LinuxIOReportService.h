@@ -22,7 +22,6 @@ namespace halvox::platform::linux_ {
 // source that is late is skipped. Looking for channels, which the service does only when it starts,
 // may take as long as the opening.
 // Owner: the platform. It owns the sources and their threads, which sleep while nobody asks.
-// asks.
 class LinuxIOReportService final : public IOReportService {
  public:
   LinuxIOReportService(std::vector<std::unique_ptr<DriverSource>> sources,

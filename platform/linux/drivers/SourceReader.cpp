@@ -36,6 +36,7 @@ SourceReader::~SourceReader() {
 
 void SourceReader::startOpening() {
   thread_ = std::thread([this] { run(); });
+  // The first reading is asked for before the source is open: it is made as soon as that is.
   opening_ = ask(kLongestOpening, Use::kFindChannels);
 }
 
@@ -80,6 +81,7 @@ SourceReader::ReadingPointer SourceReader::receive(const Asked& asked, bool& isF
 
 // Requests a reading that begins after this call. Returns its number.
 std::uint64_t SourceReader::want() {
+  // Not the reading that is being made: its values may be older than the request.
   const std::uint64_t number = lastBegun_ + 1;
   if (lastWanted_ < number) {
     lastWanted_ = number;
@@ -94,11 +96,13 @@ SourceReader::ReadingPointer SourceReader::waitFor(std::uint64_t number,
   bool inTime = true;
   while (lastMade_ < number && inTime) inTime = made_.waitUntil(mutex_, deadline);
   ReadingPointer reading = lastMade_ < number ? nullptr : handedOver_;
+  // Nobody else will take it, and a reading that is held keeps its source at work.
   if (--waiting_ == 0) handedOver_.reset();
   return reading;
 }
 
 void SourceReader::run() {
+  // On this thread, so that all sources open at the same time.
   source_->open();
   const MutexLock lock(mutex_);
   makeReadings();
@@ -112,9 +116,12 @@ void SourceReader::makeReadings() {
     const bool isSample = std::exchange(isSampleWanted_, false);
     mutex_.unlock();
     const Clock::time_point start = Clock::now();
+    // Without the lock, so that others can ask for the next reading meanwhile.
     ReadingPointer reading = source_->read();
     const Clock::duration time = Clock::now() - start;
     mutex_.lock();
+    // By the time that the reading took, and not by whether somebody waited for it: nobody waits
+    // for a late source.
     if (time <= longestWait_) isLate_ = false;
     lastMade_ = lastBegun_;
     // Also for those who wait for the next reading: it will replace this one.

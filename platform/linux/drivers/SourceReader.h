@@ -29,7 +29,7 @@ class SourceReader {
 
   // Both ends of a session wait for it on the reporting queue, and with them all other clients.
   static constexpr std::chrono::milliseconds kLongestWait{50};
-  // Once, when the service starts: what is missed then is missed for good.
+  // Once, when the service starts. What is missed then is missing until the next start.
   static constexpr std::chrono::milliseconds kLongestOpening{1000};
 
   // `longestWait` is the time that a reading may take.

@@ -19,7 +19,7 @@ constexpr std::size_t kMostEntries = 256;     // cards, PCMs of a card, substrea
 using Directory = UniqueHandle<DIR*, ::closedir>;
 
 // The number after the letters, for a name such as "card0"; none for any other name.
-std::optional<unsigned> numberBehind(std::string_view name, std::string_view letters) {
+std::optional<unsigned> numberAfter(std::string_view name, std::string_view letters) {
   if (!name.starts_with(letters)) return std::nullopt;
   const auto number = parseSysfsNumber(name.substr(letters.size()));
   if (!number.has_value() || *number > 9999) return std::nullopt;
@@ -59,19 +59,20 @@ std::vector<std::string> pcmStates() { return {kPcmStates.begin(), kPcmStates.en
 
 std::shared_ptr<const Reading> AlsaSource::read() {
   ++round_;
+  // Once for all channels, so that their times can be compared.
   time_ = now_();
   const UniqueFd asound = openDirectory((root_ / "proc/asound").c_str());
   if (asound) {
     const auto names = parseCards(textOf(asound.get(), "cards").value_or(""));
     for (const std::string& folder : namesIn(asound.get())) {
-      const auto number = numberBehind(folder, "card");
+      const auto number = numberAfter(folder, "card");
       if (!number.has_value()) continue;
       const auto name = names.find(*number);
       readCard(asound.get(), folder,
                {nameFor(folder, name == names.end() ? folder : name->second, *number)});
     }
   }
-  // What was not seen in this round has gone. A card that returns begins to count anew.
+  // What was not seen in this round has disappeared. A card that returns counts from zero.
   const auto isGone = [this](const auto& item) { return item.second.round != round_; };
   std::erase_if(substreams_, isGone);
   std::erase_if(powers_, isGone);
@@ -110,6 +111,7 @@ void AlsaSource::readCard(int asound, const std::string& folder, Card card) {
 
 void AlsaSource::readPcm(int cardDirectory, const std::string& path, const std::string& folder,
                          Card& card) {
+  // The kernel calls the folders pcm0p for playback and pcm0c for capture.
   const bool isPlayback = folder.ends_with('p');
   if (!isPlayback && !folder.ends_with('c')) return;
   const UniqueFd directory = openDirectory(folder.c_str(), cardDirectory);
@@ -132,7 +134,7 @@ void AlsaSource::readPcm(int cardDirectory, const std::string& path, const std::
 
 void AlsaSource::readSubstream(int pcmDirectory, const std::string& path, const std::string& folder,
                                const ChannelDescription& pcm) {
-  const auto number = numberBehind(folder, "sub");
+  const auto number = numberAfter(folder, "sub");
   if (!number.has_value() || substreams_.size() >= kMostChannels) return;
   const auto text = textOf(pcmDirectory, folder + "/status");
   const auto status = text.has_value() ? parsePcmStatus(*text) : std::nullopt;

@@ -4,6 +4,8 @@ namespace halvox::platform::linux_ {
 
 void PcmCounters::look(const PcmStatus& status, Clock::time_point now) {
   if (last_.has_value()) {
+    // The kernel has no history of states. A state that began and ended between two readings is not
+    // seen.
     states_[last_->state].residency +=
         std::chrono::duration_cast<std::chrono::microseconds>(now - lastTime_);
     if (last_->state != status.state) ++states_[status.state].transitions;

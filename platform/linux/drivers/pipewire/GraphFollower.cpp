@@ -24,8 +24,8 @@ constexpr UnitLog kLog(driversCategory, "GraphFollower");
 // second.
 constexpr int kRoundTrips = 2;
 
-// A socket appears before it accepts connections, and a server that ends may accept some until the
-// last moment. A few attempts are therefore made after a socket appeared or a server went.
+// A socket appears before it accepts connections, and a server that ends may still accept some. A
+// few attempts are therefore made after a socket has appeared or a connection has ended.
 constexpr int kAttempts = 5;
 constexpr auto kPauseBetweenAttempts = std::chrono::milliseconds(200);
 
@@ -129,6 +129,7 @@ bool GraphFollower::isLeased() {
 void GraphFollower::proceed() {
   proceedAfter(std::nullopt);
   const bool isWanted = isLeased();
+  // First: until it is disconnected, everything below would use the connection that has ended.
   if (std::exchange(isLost_, false)) {
     disconnect();
     if (isWanted) {
@@ -137,7 +138,9 @@ void GraphFollower::proceed() {
     }
     return;
   }
+  // Once without anybody who wants it: channels are found at the start, when no session runs yet.
   if (!server_.isConnected() && (isWanted || !isTried_)) lookForServer();
+  // Nothing wakes this thread while no session runs or the server is connected.
   if (server_.isConnected() || !isWanted) watch_.end();
   updateProfiler(isWanted);
 }
@@ -158,7 +161,7 @@ void GraphFollower::connect() {
     server_.requestAnswer();
     return;
   }
-  if (!std::exchange(isMissingTold_, true)) {
+  if (!std::exchange(isMissingLogged_, true)) {
     kLog.info("cannot connect to PipeWire: ", errnoText(errno),
               "; waiting for it while sessions run");
   }
@@ -201,6 +204,7 @@ void GraphFollower::updateProfiler(bool isWanted) {
   if (isWanted && isPossible && profiler_ == nullptr) {
     {
       const MutexLock lock(graph_.mutex);
+      // Before the binding: what the driver counted until now must not be taken for this session's.
       graph_.statistics.profilingBegan();
     }
     profiler_ = std::make_unique<pipewire::ProfilerBinding>(
@@ -223,7 +227,7 @@ void GraphFollower::onTimer(void* data, std::uint64_t /*expirations*/) {
 }
 
 void GraphFollower::onServerReached(const pw_core_info& server) {
-  isMissingTold_ = false;
+  isMissingLogged_ = false;
   attempts_ = kAttempts;
   kLog.notice("following PipeWire ", server.version, " (", server.name, ")");
   const MutexLock lock(graph_.mutex);

@@ -18,13 +18,12 @@ namespace halvox::platform::linux_ {
 
 // Follows a PipeWire server and writes its events into the graph.
 //
-//   waiting --a connection succeeds--> following --the server has gone--> waiting
+//   waiting --a connection succeeds--> following --the connection ends--> waiting
 //
 // Threads: everything runs on the loop's thread, except construction and destruction, which happen
 // while that thread does not run. PipeWireDriverSource owns it; it borrows the loop and the graph.
-// Failure: a server that is missing or goes away is not an error; PipeWireDriverSource says when it
-// is looked for.
-// says.
+// Failure: a server that is missing or disconnects is not an error. PipeWireDriverSource says when
+// it is looked for.
 class GraphFollower final : private pipewire::ServerListener {
  public:
   GraphFollower(pw_loop* loop, SharedGraph& graph);
@@ -70,7 +69,7 @@ class GraphFollower final : private pipewire::ServerListener {
   int attempts_ = 0;  // remaining attempts to connect
   bool isTried_ = false;
   bool isLost_ = false;
-  bool isMissingTold_ = false;
+  bool isMissingLogged_ = false;
   int roundTrips_ = 0;
   pipewire::UniqueContext context_;
   pipewire::ServerConnection server_;

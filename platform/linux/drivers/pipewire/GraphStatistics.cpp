@@ -43,6 +43,7 @@ GraphStatistics::GraphStatistics()
           makeChannel(describeNodeChannel(kSourceGroup, "pipewire", "connections"))} {}
 
 void GraphStatistics::serverLost(Time now) {
+  // Kept: the counts are this process's own, and continue when the server has restarted.
   for (auto& [id, node] : nodes_) keep(std::move(node), now);
   nodes_.clear();
   drivers_.clear();
@@ -67,6 +68,7 @@ void GraphStatistics::nodeRemoved(NodeID id, Time now) {
 
 void GraphStatistics::keep(std::unique_ptr<NodeStatistics> node, Time now) {
   node->left(now);
+  // Bounded, because programs can make nodes of new names without end.
   if (gone_.size() == kMostNodes) gone_.pop_front();
   gone_.push_back(std::move(node));
 }

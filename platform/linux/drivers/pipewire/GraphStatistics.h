@@ -38,14 +38,14 @@ class GraphStatistics {
   GraphStatistics();
 
   void serverReached() { ++connections_; }
-  // The server has gone, and with it all nodes.
+  // The connection has ended, and with it all nodes have disappeared.
   void serverLost(Time now);
-  // The profiler begins, after a time in which cycles were not reported.
+  // The profiler begins to report cycles. Those before this call were not reported.
   void profilingBegan();
 
-  // Returns false if the node is neither sink nor source, or is one too many; its further events
-  // are not needed then. If the key of a report would be equal for two nodes, the later one is
-  // called "name#id".
+  // Returns false if the node is neither sink nor source, or if there are kMostNodes already. Its
+  // further events are not needed then. If the key of a report would be equal for two nodes, the
+  // later one is called "name#id".
   bool nodeAdded(NodeID id, std::string_view mediaClass, std::string_view name);
   void nodeRemoved(NodeID id, Time now);
   void nodeStateChanged(NodeID id, std::optional<NodeState> state, Time now);

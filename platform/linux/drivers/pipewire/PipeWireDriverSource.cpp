@@ -54,8 +54,10 @@ class PipeWireDriverSource::Impl {
  public:
   explicit Impl(Options options) : options_(options) { pw_init(nullptr, nullptr); }
   ~Impl() {
+    // First: leases may outlive this and must not ring a loop that ends.
     bell_->remove();
     if (loop_ != nullptr) pw_thread_loop_stop(loop_);
+    // After the thread has stopped, because the connection's objects belong to it.
     connection_.reset();
     if (event_ != nullptr) pw_loop_destroy_source(pw_thread_loop_get_loop(loop_), event_);
     if (loop_ != nullptr) pw_thread_loop_destroy(loop_);
@@ -83,6 +85,7 @@ class PipeWireDriverSource::Impl {
     std::shared_ptr<void> lease;
     {
       const MutexLock lock(graph_.mutex);
+      // One lease for all sessions: the profiler is bound while any of them is held.
       lease = graph_.lease.lock();
       if (lease == nullptr) {
         lease = std::make_shared<Lease>(bell_);
@@ -91,6 +94,7 @@ class PipeWireDriverSource::Impl {
       }
       graph_.statistics.addTo(maker_, std::chrono::steady_clock::now());
     }
+    // Only the first lease has something to change. Ringing wakes the loop's thread.
     if (isNew) bell_->ring();
     return maker_.finish(std::move(lease));
   }

@@ -13,8 +13,8 @@ namespace halvox::platform::linux_ {
 // Threads: the library has a thread that follows the server. It sleeps until the server sends an
 // event. While nobody holds a reading, events come only when nodes appear, disappear or change
 // their state. The profiler, which reports each cycle, is bound only while someone holds a reading:
-// an idle service must not wake up for every cycle. A node's cycles are therefore those of such
-// times; the first reading begins one.
+// an idle service must not wake up for every cycle. Only cycles of such times are counted. The
+// first reading begins such a time.
 // Owner: its SourceReader, which calls it on one thread.
 // Failure: without a server there are only the channels "connections", which count how often the
 // server was reached. It is looked for when the first reading is held, and it is connected to as

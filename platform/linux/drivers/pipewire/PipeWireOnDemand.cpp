@@ -37,6 +37,8 @@ PipeWireOnDemand::PipeWireOnDemand()
 
 void PipeWireOnDemand::open() {
   // A module that is missing is reported at the start, and not at some session.
+  // Otherwise the first session loads it: to wait for a server, the service would have to watch for
+  // its socket all the time.
   if (hasServerSocket() || !isModuleThere()) load(kLongestOpening);
 }
 
@@ -54,6 +56,7 @@ void PipeWireOnDemand::sampled() {
   // Does not wait: other sessions' samples would wait with it.
   load(std::chrono::milliseconds::zero());
   if (source_ == nullptr) return;
+  // Without a session that holds a reading, nobody needs the server followed yet.
   if (const std::shared_ptr<Lease> lease = lease_.lock()) lease->ofLoaded = source_->read();
 }
 

@@ -9,7 +9,7 @@ namespace halvox::platform::linux_ {
 // library: the environment decides. Does not need the library.
 [[nodiscard]] std::vector<std::filesystem::path> serverSocketPaths();
 
-// Whether one of them exists. A server may be gone and its socket still be there.
+// Whether one of them exists. A socket can outlive its server.
 [[nodiscard]] bool hasServerSocket();
 
 }  // namespace halvox::platform::linux_

@@ -191,6 +191,8 @@ class BucketReader {
     if (!buckets_.empty() && upper <= lower_) {
       refuse(sample.line, "expected a greater bound than that of the previous bucket");
     }
+    // Counts of OpenMetrics include those of all lower buckets. A smaller one would become a
+    // negative difference.
     if (hits < total_) refuse(sample.line, "expected at least the hits of the previous bucket");
     buckets_.push_back({lower_, upper});
     values_.push_back(hits - total_);

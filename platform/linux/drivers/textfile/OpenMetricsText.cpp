@@ -88,6 +88,7 @@ std::optional<double> namedNumber(std::string_view text) {
   std::ranges::transform(lower, lower.begin(), [](char character) {
     return character >= 'A' && character <= 'Z' ? static_cast<char>(character + 32) : character;
   });
+  // OpenMetrics allows these names in any case.
   if (lower == "nan") return std::numeric_limits<double>::quiet_NaN();
   const bool isNegative = lower.starts_with('-');
   if (isNegative || lower.starts_with('+')) lower.erase(0, 1);
@@ -117,6 +118,7 @@ MetricLabels parseLabels(LineCursor& line) {
     if (!line.skip(',') && !line.startsWith('}')) throw Mistake{"expected , or } after the label"};
     line.skipBlanks();
   }
+  // Sorted, because labels in another order name the same series.
   std::ranges::sort(labels);
   const auto twice = std::ranges::adjacent_find(labels, {}, &MetricLabel::name);
   if (twice != labels.end()) throw Mistake{"the label " + twice->name + " appears twice"};
@@ -125,6 +127,7 @@ MetricLabels parseLabels(LineCursor& line) {
 
 // Whether a sample's name may have this suffix after the name of a family of that type.
 bool takesSuffix(MetricType type, std::string_view suffix) {
+  // The values of a histogram are those of its parts, each with a suffix.
   if (suffix.empty()) return type != MetricType::kHistogram;
   switch (type) {
     case MetricType::kCounter:
@@ -178,6 +181,8 @@ class Parser {
       if (isEnded_) throw Mistake{"expected nothing after # EOF"};
       checkLine(line);
       parseLine(line);
+      // A daemon may be writing the file at this moment. The last number could then be cut to a
+      // smaller one.
       if (end == std::string_view::npos && !isEnded_) {
         throw Mistake{"the last line has no line break: the file is incomplete"};
       }

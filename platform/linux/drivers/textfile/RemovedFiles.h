@@ -10,8 +10,7 @@
 namespace halvox::platform::linux_ {
 
 // Finds out which files were deleted from a directory since the last call, even if files with the
-// same names exist again. A file that another one was renamed over was not deleted: that is how
-// files are updated.
+// same names exist again. Renaming a file over another one updates that one and does not delete it.
 //
 // It uses inotify, but no thread waits for it: the kernel keeps the names until someone asks, so an
 // idle service makes no wake-ups. Belongs to one thread; the source owns it.

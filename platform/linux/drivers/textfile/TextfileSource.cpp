@@ -54,6 +54,8 @@ std::string reasonOf(const FileContent& file) {
 
 std::shared_ptr<const Reading> TextfileSource::read() {
   ++round_;
+  // For all files together: fifty large ones, each within its own bound, took the service to half a
+  // gigabyte.
   std::size_t room = kMostBytes;
   // Before the files are listed: whatever is deleted after this is noticed at the next reading.
   forgetRemoved();
@@ -93,13 +95,15 @@ std::vector<std::string> TextfileSource::list(int directory) {
     const std::string_view name = found->d_name;
     if (name.ends_with(".prom") && !name.starts_with('.')) files.emplace_back(name);
   }
+  // The order decides which file has a channel that several files define. It must not change
+  // between two readings.
   std::ranges::sort(files);
   const bool areTooMany = files.size() > kMostFiles;
-  if (areTooMany && !std::exchange(hasToldOfTooMany_, true)) {
+  if (areTooMany && !std::exchange(isExcessLogged_, true)) {
     kLog.error("the directory ", directory_.string(), " has more than ", kMostFiles,
                " files; skipping those after the first ", kMostFiles);
   }
-  hasToldOfTooMany_ = areTooMany;
+  isExcessLogged_ = areTooMany;
   if (areTooMany) files.resize(kMostFiles);
   return files;
 }
@@ -124,6 +128,7 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
   if (isSame && entry.isSettled) return;
   if (!isSame) entry.complaint.clear();
   entry.state = state;
+  // Until then the file is read again each time, because its time may not show another change.
   entry.isSettled = state.error != 0 || now() - state.changedAt > kTimeStep;
   if (!state.hasRoom) {
     isChanged_ |= std::exchange(entry.isGood, false);
@@ -158,6 +163,7 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
 
 void TextfileSource::take(std::vector<MetricChannel>&& channels, Entry& entry) {
   std::map<std::string, Channel> known;
+  // Channels that are still in the file keep their objects: differences compare addresses.
   for (const Channel& channel : entry.channels) known.emplace(channel->fullName(), channel);
   entry.channels.clear();
   entry.values.clear();
@@ -179,12 +185,12 @@ void TextfileSource::complain(const std::string& file, const std::string& what, 
 }
 
 void TextfileSource::chooseChannels() {
-  std::unordered_set<std::string> told;
+  std::unordered_set<std::string> seen;
   for (auto& [file, entry] : entries_) {
     if (!entry.isGood) continue;
     entry.isShown.assign(entry.channels.size(), true);
     for (std::size_t index = 0; index < entry.channels.size(); ++index) {
-      if (told.insert(entry.channels[index]->fullName()).second) continue;
+      if (seen.insert(entry.channels[index]->fullName()).second) continue;
       entry.isShown[index] = false;
       // One line for each file, however many channels it shares with others.
       if (entry.complaint.empty()) {

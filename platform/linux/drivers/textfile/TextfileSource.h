@@ -76,7 +76,7 @@ class TextfileSource final : public DriverSource {
   RemovedFiles removedFiles_;
   std::map<std::string, Entry> entries_;  // by file name
   std::uint64_t round_ = 0;
-  bool hasToldOfTooMany_ = false;
+  bool isExcessLogged_ = false;
   bool isChanged_ = false;  // a file has changed since the channels were chosen
   ReadingMaker readings_;
 };
