@@ -31,9 +31,9 @@ class ClockService {
   // A date in the time zone of the platform. A date outside its calendar, or a NaN, gives the
   // default LocalTime: dates come from clients, and a name made from one must not fail.
   [[nodiscard]] virtual LocalTime localTime(Date date) const = 0;
-  // Seconds since the system started, suspended time included.
+  // Seconds since the system started, including time in which it was suspended.
   [[nodiscard]] virtual std::chrono::duration<double> systemUptime() const = 0;
-  // Time since the kernel started this process, suspended time included.
+  // Time since the kernel started this process, including time in which the machine was suspended.
   [[nodiscard]] virtual std::chrono::milliseconds processUptime() const = 0;
 };
 

@@ -128,9 +128,9 @@ class NSXPCConnection {
   virtual void setExportedInterface(const NSXPCInterface& interface) = 0;
   // The connection holds the object until it is invalidated.
   virtual void setExportedObject(std::shared_ptr<ExportedObject> object) = 0;
-  // Called when the other end is gone but the connection might come back.
+  // Called when the other end has disconnected but the connection might come back.
   virtual void setInterruptionHandler(std::function<void()> handler) = 0;
-  // Called once, after everything else, when the connection has ended for good.
+  // Called once, after all other calls: the connection has ended and does not come back.
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
   // Starts delivery. Requests arrive from the thread's next turn on, never inside this call.
   virtual void resume() = 0;

@@ -9,7 +9,8 @@
 
 namespace halvox::platform {
 
-// A job must not throw: an adapter logs and counts the exception, and the queue goes on.
+// A job must not throw. If it does, the adapter logs and counts the exception, and the queue
+// continues.
 using Job = std::function<void()>;
 
 // How urgent the work of a queue is. Clients wait for user-interactive work; nobody waits for
@@ -31,8 +32,7 @@ class DispatchSemaphore {
   virtual ~DispatchSemaphore() = default;
   virtual void signal() = 0;
   // Blocks the calling thread until there is a signal, and consumes it. There is no time limit.
-  // Only for a thread that is meant to stand still; a job of a queue uses waitOn(), which costs no
-  // thread.
+  // Only for a thread that may block. A job of a queue uses waitOn(), which costs no thread.
   virtual void wait() = 0;
 };
 

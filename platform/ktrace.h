@@ -17,7 +17,7 @@ struct trace_point {
   std::uint64_t arg3 = 0;
   std::uint64_t arg4 = 0;
   std::uint64_t threadid = 0;
-  std::uint32_t debugid = 0;  // the whole identifier, function qualifiers included
+  std::uint32_t debugid = 0;  // the whole identifier, including its function qualifier
   std::uint32_t cpu = 0;
   double walltime = 0;             // seconds since 1970; 0 unless wall times were enabled
   std::array<char, 16> command{};  // NUL-terminated

@@ -46,7 +46,7 @@ class TLMSecureHierarchyToken {
 };
 
 // A session of the framework: what its back-ends need to know about it. The framework makes it; the
-// code that asked for it holds it, and ends it by letting go of it.
+// code that asked for it holds it, and ends it by releasing it.
 class TLMReportingSession {
  public:
   virtual ~TLMReportingSession() = default;
@@ -87,7 +87,7 @@ class TLMReportingService {
                                             const Dictionary& userInfo) = 0;
   // Begins to look for back-ends and returns. The callback is called exactly once, on a thread of
   // the framework: never inside this call, and never on the queue of the caller's job, which may be
-  // waiting for it. It may run before this call returns, and after everyone else has let go of the
+  // waiting for it. It may run before this call returns, and after everyone else has released the
   // session. It must own what it uses.
   virtual void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) = 0;
   virtual TLMReportingOutcome TLMReportingSendMessage(const Session& session,

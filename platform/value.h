@@ -18,7 +18,7 @@ class Array;
 class Dictionary;
 
 // A point in time: seconds since 1970-01-01 00:00 UTC. It comes from clients, so any double is
-// possible, NaN and infinities included.
+// possible, including NaN and the infinities.
 struct Date {
   double secondsSince1970 = 0;
   friend bool operator==(const Date&, const Date&) = default;
@@ -352,7 +352,7 @@ class Dictionary {
   void merge(const Dictionary& other);
 
   [[nodiscard]] bool isIdenticalTo(const Dictionary& other) const { return rep_ == other.rep_; }
-  // Bytes on the heap that this dictionary keeps in memory, shared ones included.
+  // Bytes on the heap that this dictionary keeps in memory, including shared ones.
   [[nodiscard]] std::size_t memorySize() const;
 
   friend bool operator==(const Dictionary& left, const Dictionary& right);

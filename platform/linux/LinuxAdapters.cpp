@@ -13,6 +13,8 @@ ConnectionOptions connectionOptions(const Configuration& configuration) {
   ConnectionOptions options;
   options.socket = configuration.listener.socket;
   options.socketAccess = {configuration.listener.mode, configuration.listener.group};
+  // Only that of the default socket, which nobody may have made in a fresh login. The directory of
+  // a configured path is the administrator's.
   options.makeSocketDirectory = configuration.listener.socket == defaultSocketPath();
   options.bus = configuration.listener.bus;
   options.starter = starterBus();
@@ -40,6 +42,7 @@ SnapshotOptions snapshotOptions(const Configuration& configuration) {
   return options;
 }
 
+// A service without trace points serves all the same. The reason is logged at the start.
 std::unique_ptr<KdebugService> makeKdebug(std::string& failure) {
   auto loaded = LttngKdebugService::load();
   if (loaded) return *std::move(loaded);
@@ -53,7 +56,7 @@ TraceOptions traceOptions(const Configuration& configuration, FeatureFlagService
           .tracing = isEnabled ? Tracing::kEnabled : Tracing::kDisabled};
 }
 
-// Null when the link goes elsewhere, or when its module cannot be loaded.
+// Null if link.backend is not "nats" or if its module cannot be loaded.
 std::unique_ptr<NatsTlmReporting> makeNats(const Configuration::Link& options,
                                            const NatsEnvironment& environment,
                                            std::string& failure) {
@@ -85,7 +88,7 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
       kdebug(makeKdebug(kdebugFailure)),
       log(QueuedLogService::onStandardError({configuration.logLevel, configuration.logMemoryLevel},
                                             statistics)),
-      // Its last line tells why the process ended.
+      // Writes what is in the log's queue: its last line says why the process ends.
       process([this] { log->stop(); }),
       deviceProperties(configuration.device),
       featureFlags(configuration.features),

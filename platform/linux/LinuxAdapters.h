@@ -49,8 +49,8 @@ struct LinuxAdapters {
   // The adapter of the back-end that the configuration names.
   [[nodiscard]] TLMReportingService& realTimeLink();
 
-  // The connections come before all that has threads, because they take the end signals from every
-  // thread that starts after them.
+  // The connections come before everything that has threads, because they block the end signals in
+  // every thread that starts after them.
   const Configuration configuration;
   CounterStatisticsService statistics;
   Backpressure backpressure;
@@ -81,8 +81,8 @@ struct LinuxAdapters {
   JsonResultsFileService resultsFiles;
   const std::unique_ptr<TraceServices> traces;
   AsioDispatchService dispatch;
-  std::string natsFailure;                       // empty unless the link is to go there and cannot
-  const std::unique_ptr<NatsTlmReporting> nats;  // only when the link goes there
+  std::string natsFailure;  // why link.backend = "nats" is impossible, or empty
+  const std::unique_ptr<NatsTlmReporting> nats;  // null unless link.backend is "nats"
 };
 
 }  // namespace halvox::platform::linux_

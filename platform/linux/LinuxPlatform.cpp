@@ -98,9 +98,12 @@ std::optional<StartFailure> LinuxPlatform::open() {
   if (!adapters_->natsFailure.empty()) {
     return StartFailure{EX_CONFIG, "link.backend = \"nats\" needs " + adapters_->natsFailure};
   }
+  // The store before the sockets: whatever is accepted can then be kept.
   if (const auto error = adapters_->store.open()) {
     return startFailure(*error);
   }
+  // After the store, whose lock shows that no other service uses the directory: what is removed
+  // here could be in use.
   adapters_->diagnosticReporters.removeLeftovers();
   adapters_->traces->open();
   adapters_->ioReport.open();
@@ -112,16 +115,20 @@ std::optional<StartFailure> LinuxPlatform::open() {
 }
 
 bool LinuxPlatform::close() {
+  // First what adds jobs to the queues: captures reply through them.
   adapters_->diagnosticReporters.stop();
   adapters_->notify.stop();  // it adds jobs to queues
+  // Before the queues: a stop of a session may wait for a trace that is still being read.
   adapters_->traces->stop();
-  // What sessions were sent is to reach the link; its queues give way to all else, so they may be
-  // behind.
+  // A message that was answered without an error reaches the link, and its queue still holds it.
+  // These queues have a lower priority than requests, so some of their jobs may still wait.
   adapters_->dispatch.finish(kQueuesFinishWithin);
   const bool ended = adapters_->dispatch.stop(kJobsEndWithin);
   ended ? adapters_->traces->close() : adapters_->traces->abandon();
+  // After the queues: no session can ask for a callback any more.
   adapters_->linkCallbacks.stop();
   const bool linkEnded = !adapters_->nats || adapters_->nats->close();
+  // After the link: the local one writes to the store until its last message.
   adapters_->store.close();
   logStatistics(adapters_->statistics, LogLevel::kInfo, Counters::kCounted);
   adapters_->log->stop();

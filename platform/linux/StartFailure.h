@@ -7,8 +7,8 @@ namespace halvox::platform::linux_ {
 struct ConnectionOpenError;
 struct StoreError;
 
-// Why the service cannot start: one line for the user, and the exit status that tells scripts
-// which kind of reason it was (those of sysexits.h).
+// Why the service cannot start: one line for the user, and an exit status of sysexits.h, by which
+// scripts distinguish the kinds of reasons.
 struct StartFailure {
   int exitStatus;
   std::string description;

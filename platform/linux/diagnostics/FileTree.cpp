@@ -29,6 +29,7 @@ std::vector<fs::path> filesBelow(const fs::path& root, const TreeBounds& bounds,
     }
     std::error_code ignored;
     if (at.depth() + 1 >= bounds.depth) at.disable_recursion_pending();
+    // Links are not followed; they could lead out of the tree, or in circles.
     if (at->is_symlink(ignored) || !at->is_regular_file(ignored)) continue;
     paths.push_back(at->path());
   }
@@ -47,6 +48,7 @@ Tree readTree(const fs::path& root, const TreeBounds& bounds, const Deadline& de
       break;
     }
     Finding finding = readBounded(path, std::min(bounds.bytesOfFile, room));
+    // One file that cannot be read costs only itself.
     if (!finding.isCollected()) {
       ++tree.unreadable;
       continue;

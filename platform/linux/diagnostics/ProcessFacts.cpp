@@ -63,6 +63,7 @@ class Facts {
     add(key, replaceInvalidUtf8(finding.bytes));
   }
   [[nodiscard]] Dictionary take() {
+    // A capture says what is missing and why. A reader could otherwise take it for absent.
     if (!failures_.empty()) facts_.set("not_readable", failures_);
     return std::move(facts_);
   }
@@ -77,6 +78,8 @@ void addCommandLine(Facts& facts, const fs::path& process) {
   if (!finding.isCollected()) return facts.addFailure("cmdline", finding.failure);
   std::vector<Value> words;
   for (std::size_t begin = 0; begin < finding.bytes.size();) {
+    // The kernel ends each word with a NUL. A process that has overwritten its words may lack the
+    // last one.
     const std::size_t end = std::min(finding.bytes.find('\0', begin), finding.bytes.size());
     words.emplace_back(replaceInvalidUtf8(finding.bytes.substr(begin, end - begin)));
     begin = end + 1;
@@ -143,6 +146,7 @@ void addMaps(Facts& facts, const fs::path& process) {
     begin = end + 1;
   }
   std::vector<std::pair<std::string, Mapped>> bySize(all.begin(), all.end());
+  // The largest first, because only kMostMappedFiles are kept.
   std::ranges::stable_sort(bySize, std::ranges::greater{},
                            [](const auto& entry) { return entry.second.bytes; });
   Mapped sum;
@@ -183,6 +187,7 @@ Dictionary processFacts(const fs::path& procRoot, std::string_view name, const D
   std::vector<Value> processes;
   for (const std::int32_t pid : numberedEntries(procRoot, kMostOpenFiles, error)) {
     if (deadline.hasPassed()) break;
+    // By name, because that is all that a signature has. Several processes may have it.
     if (commandName(procRoot / std::to_string(pid)) != name) continue;
     ++found;
     if (processes.size() < kMostProcesses) processes.emplace_back(factsOf(procRoot, pid));

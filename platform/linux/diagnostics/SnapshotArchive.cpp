@@ -61,6 +61,8 @@ SnapshotArchive::~SnapshotArchive() {
 }
 
 SnapshotArchive::Failure SnapshotArchive::open() {
+  // Removes the file of a service that was killed. O_EXCL then makes sure that the new file is
+  // ours.
   ::unlink(path_.c_str());
   writer_->file.reset(
       ::open(path_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, kMode));
@@ -99,6 +101,7 @@ SnapshotArchive::Failure SnapshotArchive::finish() {
   writer_->handle.reset();
   if (Failure failure = writeFailure()) return failure;
   struct stat status {};
+  // Before the archive gets its name: after a power cut, one with a name must be complete.
   if (::fsync(writer_->file.get()) != 0 || ::fstat(writer_->file.get(), &status) != 0) {
     return path_.native() + ": " + errnoText(errno);
   }

@@ -165,6 +165,7 @@ void SnapshotCollector::addPart(const char* name, const std::function<Finding()>
   if (isOver()) return;
   const Clock::time_point begun = Clock::now();
   Finding finding = deadline_.hasPassed() ? Finding::failed("the time limit was reached") : find();
+  // A capture that the end of the service cuts short is dropped as a whole.
   if (deadline_.stop().isRaised()) {
     failure_ = "the service is ending";
     return;

@@ -127,6 +127,7 @@ SnapshotDiagnosticReporterService::Worker::Taken SnapshotDiagnosticReporterServi
   if (isInWork_) return Taken::kBusy;
   isInWork_ = true;
   waiting_.emplace(std::move(work));
+  // Made by the first request: most services never take a snapshot.
   if (!thread_.joinable()) thread_ = std::thread(&Worker::run, this);
   wakeUp_.notifyOne();
   return Taken::kTaken;
@@ -141,6 +142,7 @@ void SnapshotDiagnosticReporterService::Worker::stop() {
   std::thread ended;
   {
     const MutexLock lock(mutex_);
+    // Wakes a capture in all of its waits: each of them polls this flag.
     stop_.raise();
     wakeUp_.notifyOne();
     ended = std::move(thread_);
@@ -187,6 +189,7 @@ Outcome SnapshotDiagnosticReporterService::Worker::capture(const SnapshotRequest
                           .dumpWithin = options_.dumpWithin};
   {
     const MutexLock lock(mutex_);
+    // A copy: asking for the state waits, and must not hold the lock.
     sources.state = state_;
   }
   const Deadline deadline(stop_, std::chrono::steady_clock::now() + options_.collectWithin);
@@ -210,7 +213,9 @@ Dictionary SnapshotDiagnosticReporterService::Worker::conclude(const SnapshotReq
     if (errorLines_.tryPass()) kLog.error("cannot take a snapshot: ", outcome.failure);
     return errorReply(outcome.failure);
   }
+  // After the new one has its name: a capture that fails must not cost an old one.
   directory_.keepNewest(options_.keep, outcome.path);
+  // After the file has its name: a record must not name a file that does not exist.
   if (partners_.recorder != nullptr) {
     partners_.recorder->recordSnapshot(request.time, request.signature, outcome.path);
   }

@@ -94,6 +94,7 @@ std::string namePart(std::string_view text) {
                        (character >= 'A' && character <= 'Z') ||
                        (character >= '0' && character <= '9') || character == '_' ||
                        character == '-' || character == '.';
+    // Types and sub-types come from messages and may contain anything, such as "/".
     if (!stays) character = '_';
   }
   if (part.empty()) return "unknown";
@@ -128,6 +129,7 @@ Result<fs::path> SnapshotDirectory::publish(Date time, std::string_view type,
     const fs::path to = path_ / name;
     error = renameToFree(temporaryPath(), to);
     if (error != 0) continue;
+    // The new name is not on the disk before its directory is.
     syncDirectory(path_);
     return to;
   }
@@ -163,6 +165,7 @@ std::vector<fs::path> SnapshotDirectory::newestFirst() const {
 void SnapshotDirectory::keepNewest(std::size_t count, const fs::path& justWritten) const {
   std::size_t kept = 1;  // the one just written
   for (const fs::path& path : newestFirst()) {
+    // Kept even if others look newer: the clock may have been set back.
     if (path == justWritten) continue;
     if (kept < count) {
       ++kept;

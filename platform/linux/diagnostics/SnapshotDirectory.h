@@ -11,9 +11,10 @@
 
 namespace halvox::platform::linux_ {
 
-// The directory that holds the snapshots: names them, deletes old ones, and removes what a killed
-// service left behind. Remembers nothing between calls, so that the directory may be deleted at any
-// time; any thread may call. All functions but path() and temporaryPath() block on the disk.
+// The directory that holds the snapshots: names them, deletes old ones, and removes the unfinished
+// file of a service that was killed. Remembers nothing between calls, because the directory may be
+// deleted at any time. Any thread may call. All functions except path() and temporaryPath() block
+// on the disk.
 class SnapshotDirectory {
  public:
   explicit SnapshotDirectory(const std::filesystem::path& storageDirectory)

@@ -49,6 +49,7 @@ RootedDirectory step(const UniqueFd& parent, const std::string& name, const std:
     made = ::mkdirat(parent.get(), name.c_str(), kParentPermissions) == 0;
     if (!made && errno != EEXIST) return failed("create directory", path, errno);
   }
+  // One name at a time: O_NOFOLLOW looks at the last name of a path only.
   UniqueFd directory(::openat(parent.get(), name.c_str(), kOpenFlags | O_NOFOLLOW));
   if (!directory) return failed("open directory", path, reasonAt(parent, name, errno));
   return {std::move(directory), std::nullopt};

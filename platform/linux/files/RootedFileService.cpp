@@ -46,6 +46,7 @@ class RootedJsonArrayFile final : public JsonArrayFile {
 
   std::optional<Error> commit(std::string& path) override {
     if (!isCommitted_ && !error_.has_value()) finish();
+    // Counted once, however often the caller asks again.
     if (!isCommitted_) (error_.has_value() ? counters_.failed : counters_.written).add();
     isCommitted_ = true;
     if (!error_.has_value()) path = path_;

@@ -36,6 +36,8 @@ bool isLeftOver(int directory, const char* name) {
   struct stat status {};
   if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return false;
   const auto age = ::time(nullptr) - status.st_mtime;
+  // A file that is still being written is locked by its writer. The kernel releases the lock of one
+  // that was killed.
   return age > kLeftOverAge.count() && ::flock(file.get(), LOCK_EX | LOCK_NB) == 0;
 }
 
@@ -44,6 +46,8 @@ bool isLeftOver(int directory, const char* name) {
 int UnfinishedFile::begin(UniqueFd directory, Naming naming) {
   directory_ = std::move(directory);
   if (naming == Naming::kOwnName) return beginNamed();
+  // A file without a name: the kernel removes it with its last descriptor, however the process
+  // ends.
   file_.reset(::openat(directory_.get(), ".", O_TMPFILE | O_WRONLY | O_CLOEXEC, kPermissions));
   if (file_) return 0;
   const bool isUnknown = errno == EOPNOTSUPP || errno == EISDIR || errno == EINVAL;
@@ -74,12 +78,14 @@ int UnfinishedFile::write(std::string_view bytes) {
 }
 
 int UnfinishedFile::finish(const std::string& name) {
+  // Before the name: after a power cut, a file with a name must have its content.
   if (::fsync(file_.get()) != 0) return errno;
   if (const int error = giveName(name)) return error;
   ownName_.clear();
   // The name is not on the disk before the directory is. A file system that cannot sync a directory
   // answers EINVAL; the file is finished all the same.
   if (::fsync(directory_.get()) != 0 && errno != EINVAL) return errno;
+  // Here, where the directory is being written anyway.
   removeLeftOvers();
   discard();
   return 0;

@@ -27,7 +27,7 @@ class LogMemory {
   struct Contents {
     std::string text;         // the lines as a log file shows them, each with its end
     std::uint64_t lines = 0;  // in the text
-    std::uint64_t added = 0;  // since the start, replaced lines included
+    std::uint64_t added = 0;  // since the start, including replaced lines
   };
 
   // Keeps lines of `level` and above.

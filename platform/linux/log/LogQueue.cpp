@@ -19,11 +19,13 @@ bool LogQueue::add(LogEntry entry) {
   bool isFirst = false;
   {
     const MutexLock lock(mutex_);
+    // Drops the new line: those who log never wait for a slow reader.
     if (hasEnded_ || bytes_ + cost > room) return false;
     isFirst = entries_.empty();
     entries_.push_back(std::move(entry));
     bytes_ += cost;
   }
+  // Only the first: the log's thread takes all entries before it sleeps.
   if (isFirst) wakeUp_.notifyOne();
   return true;
 }
@@ -36,6 +38,7 @@ bool LogQueue::take(std::vector<LogEntry>& entries) {
     if (hasEnded_) return false;
     wakeUp_.wait(mutex_);
   }
+  // All at once: the lock is held for a moment, however long the lines take to write.
   entries.swap(entries_);
   bytes_ = 0;
   return true;

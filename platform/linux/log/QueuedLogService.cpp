@@ -33,6 +33,7 @@ class QueuedLogService::Category final : public LogCategory {
       service_.memory_->add(entry, start);
     }
     if (level < service_.levels_.written) return;
+    // Copied only now: a line that is not written needs no text.
     entry.text = start;
     service_.add(std::move(entry));
   }
@@ -74,6 +75,8 @@ LogCategory& QueuedLogService::createCategory(std::string_view subsystem,
 }
 
 void QueuedLogService::stop() {
+  // In this order: the thread then writes what is queued, and a reader that does not read has a
+  // second for it.
   queue_.end();
   sink_->finish();
   if (thread_.joinable()) thread_.join();

@@ -25,8 +25,8 @@ constexpr std::size_t kChunk = 4096;
 constexpr std::chrono::milliseconds kLastWait{1000};
 
 // Waits for its reader in poll(2) without a time-out: a stuck reader causes no wake-ups. finish()
-// wakes it through an event descriptor. The descriptor stays blocking, because it is shared with
-// other processes; hence poll() and short writes.
+// wakes it through an event descriptor. The log's descriptor stays blocking, because it is shared
+// with other processes. poll() and short writes keep the thread from blocking in write(2).
 // Threads: the log's thread; finish() from any.
 class TextLogSink final : public LogSink {
  public:
@@ -76,6 +76,7 @@ bool TextLogSink::waitForReader() {
       const auto left =
           std::chrono::duration_cast<std::chrono::milliseconds>(*deadline_ - Clock::now());
       timeout = static_cast<int>(std::max<std::int64_t>(left.count(), 0));
+      // Not asked again: an event that stays readable would end each wait at once.
       polled[1].fd = -1;
     }
     const int ready = ::poll(polled.data(), polled.size(), timeout);

@@ -40,6 +40,8 @@ std::optional<std::int64_t> startTicks(std::string_view stat) {
 }
 
 std::chrono::nanoseconds ownStart() {
+  // The kernel counts the start of a process by this clock, which includes the time that the
+  // machine was suspended.
   const std::chrono::nanoseconds now = read(CLOCK_BOOTTIME);
   const FileContent stat =
       readWholeFile({.path = "/proc/self/stat", .most = 1024, .excess = FileToRead::Excess::kCut});

@@ -8,8 +8,8 @@ namespace halvox::platform::linux_ {
 
 // The clocks of the C library. Uptimes include the time in which the machine was suspended.
 //
-// Any thread may call; nothing fails. The platform owns it, and makes it early: if the kernel does
-// not tell when the process started, processUptime() counts from the constructor.
+// Any thread may call; nothing fails. The platform owns it, and makes it early: if the start time
+// of the process cannot be read, processUptime() counts from the constructor.
 class LibcClockService final : public ClockService {
  public:
   LibcClockService();

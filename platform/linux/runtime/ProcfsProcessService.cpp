@@ -14,7 +14,7 @@ namespace {
 constexpr std::size_t kLongestName = 15;
 
 // The name in a `comm` file: everything except the newline that the kernel appends. A name may
-// contain any character but NUL, newlines and parentheses included.
+// contain any character but NUL, including newlines and parentheses.
 std::optional<std::string> readCommandName(const std::string& path) {
   // Names of kernel threads are longer than those of processes.
   const FileContent file =
@@ -44,6 +44,7 @@ std::string ProcfsProcessService::ownProcessName() const {
 
 void ProcfsProcessService::terminate(int exitStatus) {
   if (beforeEnd_) beforeEnd_();
+  // Not exit(): other threads still run, and destructors of what they use would race with them.
   ::_exit(exitStatus);
 }
 

@@ -72,6 +72,8 @@ std::error_code DirectoryWatch::watchWay(std::size_t directory) {
     const bool isTarget = path == target;
     Watch* watch = nullptr;
     std::error_code error = add(path, isTarget ? kChanging | kLeaving : kLeaving, watch);
+    // A path that ends early is watched where it ends, so that the missing directory is noticed
+    // when it appears.
     if (isMissing(error) && !parent.empty()) {
       Watch* last = nullptr;
       if (const auto refused = add(parent, kAppearing, last)) return refused;
@@ -105,6 +107,7 @@ DirectoryWatch::State DirectoryWatch::read(const OnChange& onChange) {
       next += sizeof(inotify_event) + event->len;
       if ((event->mask & kGone) != 0) state = State::kMustBeArmedAgain;
       const auto watch = watches_.find(event->wd);
+      // Of a watch that was removed, or about the directory itself, which kGone covers.
       if (watch == watches_.end() || event->len == 0) continue;
       const std::string_view file(event->name);
       if (watch->second.awaited.contains(file)) state = State::kMustBeArmedAgain;

@@ -79,6 +79,7 @@ NotifyStatus InotifyNotifyService::notify_register_dispatch(std::string_view nam
 }
 
 bool InotifyNotifyService::ensureRunning() {
+  // A service in which nothing registers has no thread for this.
   if (thread_.joinable()) return true;
   wake_.reset(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
   if (!wake_) return false;
@@ -95,6 +96,7 @@ void InotifyNotifyService::stop() {
   {
     const MutexLock held(mutex_);
     isStopping_ = true;
+    // Joined without the lock, which the thread takes to adopt registrations.
     ending.swap(thread_);
     if (wake_) static_cast<void>(::eventfd_write(wake_.get(), 1));
   }
@@ -111,6 +113,7 @@ void InotifyNotifyService::run() {
   arm();
   while (adoptRegistrations()) {
     std::array<pollfd, 2> polled{{{wake, POLLIN, 0}, {watch_.descriptor(), POLLIN, 0}}};
+    // Sleeps without a time limit while nothing has changed and watching works.
     if (::poll(polled.data(), polled.size(), pollTimeout(nextWork())) < 0) continue;
     if (polled[0].revents != 0) drain(wake);
     if (polled[1].revents != 0) readChanges();
@@ -138,6 +141,7 @@ bool InotifyNotifyService::adoptRegistrations() {
 
 void InotifyNotifyService::arm() {
   const bool wasFailing = retryAt_.has_value();
+  // Links first: their targets decide which directories are watched.
   linked_ = settings_.linkedSettings();
   notifyLinks_ = linkedFiles(directories_[kNotifyDirectory]);
   std::vector<std::filesystem::path> directories = directories_;
@@ -156,6 +160,8 @@ void InotifyNotifyService::arm() {
     kLog.notice("watching the directories of the settings again");
   }
   logNotifyDirectory();
+  // Whatever changed while nothing was watched, or whose events were lost, is found by comparing
+  // everything once.
   settings_.noteEverything();
   noteNews();
 }
@@ -224,6 +230,7 @@ void InotifyNotifyService::deliver() {
   if (!firstNews_.has_value()) return;
   if (Clock::now() < std::min(lastNews_ + kQuietTime, *firstNews_ + kLongestDelay)) return;
   firstNews_.reset();
+  // A set: one save can change several domains of one name, and is one post.
   const std::set<std::string> posted = settings_.settle();
   for (const Registration& one : registrations_) {
     if (!posted.contains(one.name)) continue;

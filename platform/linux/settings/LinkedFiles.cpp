@@ -22,6 +22,8 @@ std::vector<fs::path> linkedFiles(const fs::path& path) {
     const fs::path part = rest.front();
     rest.pop_front();
     if (part.empty() || part == ".") continue;
+    // Relative to what the links before it led to, as the kernel does it. lexically_normal() would
+    // be wrong after a link.
     if (part == "..") {
       way = way.parent_path();
       continue;
@@ -36,6 +38,7 @@ std::vector<fs::path> linkedFiles(const fs::path& path) {
       rest.insert(rest.begin(), target.begin(), target.end());
     }
   }
+  // The target too: a change of it is a change of the file.
   if (!found.empty()) found.push_back(way);
   return found;
 }

@@ -19,6 +19,7 @@ constexpr std::size_t kLongestReason = 400;
 
 Failure<> problem(const std::filesystem::path& file, std::string_view what) {
   Failure<> error;
+  // The path as a whole: it is what the user needs to find the file.
   appendEscaped(error.message, file.native(), std::numeric_limits<std::size_t>::max());
   appendEscaped(error.message, what, kLongestReason);
   return error;

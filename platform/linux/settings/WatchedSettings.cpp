@@ -57,6 +57,7 @@ SettingBaseline WatchedSettings::look(const std::string& name) const {
 }
 
 void WatchedSettings::add(const std::string& name, SettingBaseline&& baseline) {
+  // Compared with the current state once: it may have changed since the baseline was taken.
   if (names_.known.emplace(name, NotifyFile{baseline.file}).second) names_.news.insert(name);
   for (auto& [domain, values] : baseline.domains) {
     if (domains_.known.emplace(domain, std::move(values)).second) domains_.news.insert(domain);
@@ -66,6 +67,7 @@ void WatchedSettings::add(const std::string& name, SettingBaseline&& baseline) {
 void WatchedSettings::noteNotifyFile(std::string_view file) {
   const auto known = names_.known.find(file);
   if (known == names_.known.end()) return;
+  // The event is enough: a file that is deleted again before its state is read was a post, too.
   known->second.wasTouched = true;
   names_.news.insert(known->first);
 }
@@ -130,6 +132,7 @@ bool WatchedSettings::settleDomain(const std::string& domain) {
     return false;
   }
   Dictionary& known = domains_.known[domain];
+  // A save without a change, or a change of another application's values.
   if (*now == known) {
     counters_.noticed.add();
     counters_.unchanged.add();
