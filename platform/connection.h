@@ -60,7 +60,7 @@ using RequestToken = std::shared_ptr<void>;
 // What a request has besides its arguments.
 struct RequestContext {
   ProcessID sender = 0;  // the process at the other end of the connection; 0 if it is unknown
-  RequestToken token{};  // whoever queues work for the request keeps it in the job
+  RequestToken token{};  // code that queues work for the request keeps it in the job
 };
 
 // One request, decoded and checked against the method's signature. The arguments belong to the
@@ -112,7 +112,7 @@ struct NSXPCInterface {
 //   made --resume--> open --> invalidated
 //                     └--> interrupted --> open or invalidated
 //
-// Shared by the service that made it and by whoever holds it for an answer. Handlers and requests
+// Shared by the service that made it and by code that holds it for an answer. Handlers and requests
 // run on the connection's thread, one at a time. Whatever goes wrong on the wire ends in the
 // invalidation handler; no call here fails.
 class NSXPCConnection {

@@ -11,7 +11,7 @@ namespace halvox::platform {
 
 // Asks the bug-capture service for diagnostics of one kind of problem.
 //
-// Any thread may call; nothing blocks. Shared by everyone who reports problems. A capture that
+// Any thread may call; nothing blocks. Shared by everything that reports problems. A capture that
 // fails is reported in the reply.
 class AILDiagnosticReporter {
  public:

@@ -26,7 +26,8 @@ enum class QueueThreading : std::uint8_t { kOwnThread, kShared };
 enum class JobWeight : std::uint8_t { kBrief, kMayBlock };
 
 // Counts signals until they are consumed. Any thread may signal, and a signal without a waiter is
-// kept. Shared by those who signal and those who wait; a queue that waits on it also holds it.
+// kept. Shared by the code that signals and the code that waits. A queue that waits on it also
+// holds it.
 class DispatchSemaphore {
  public:
   virtual ~DispatchSemaphore() = default;

@@ -140,7 +140,7 @@ class IOReportChannels {
   virtual ~IOReportChannels() = default;
 };
 
-// Channels that are sampled together. Shared by everyone who samples it.
+// Channels that are sampled together. Shared by everything that samples it.
 class IOReportSubscription {
  public:
   virtual ~IOReportSubscription() = default;

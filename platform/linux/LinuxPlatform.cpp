@@ -49,7 +49,7 @@ const char* busName(BusKind kind) {
   return "";
 }
 
-// Those that counted anything, or all.
+// Which counters to log: those above 0, or all.
 enum class Counters : std::uint8_t { kCounted, kAll };
 
 void logStatistics(const CounterStatisticsService& statistics, LogLevel level, Counters counters) {

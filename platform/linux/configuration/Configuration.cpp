@@ -25,6 +25,7 @@ constexpr std::size_t kLargestFile = 1U << 20U;
 constexpr std::size_t kLongestPath = 4000;
 constexpr std::size_t kLongestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
 constexpr std::size_t kLongestStreamName = 255;  // the server uses it as the name of a directory
+// A hundred years and a tebibyte. Within these, seconds and bytes fit into 64 bits.
 constexpr NumberRange kDays{1, 36'500};
 constexpr NumberRange kMegabytes{1, 1U << 20U};
 constexpr NumberRange kReplicas{1, 5};  // what JetStream accepts
@@ -124,6 +125,7 @@ void readStorage(TableReader table, Configuration::Storage& storage) {
   table.read("retention_days", kDays, days);
   table.read("max_megabytes", kMegabytes, megabytes);
   table.finish();
+  // Only now: the default depends on the directory that the file names.
   storage.root = root.empty() ? storage.directory / "root" : root;
   storage.retentionDays = static_cast<std::uint32_t>(days);
   storage.maxMegabytes = static_cast<std::uint32_t>(megabytes);
@@ -279,6 +281,7 @@ std::variant<Configuration, ConfigurationError> parse(const std::string& file,
   configuration.device = root.table("device").readValues();
   readDrivers(root.table("drivers"), configuration.drivers);
   root.finish();
+  // After all tables: the first mistake in the text may be in the table that is read last.
   if (mistakes.first().has_value()) return *mistakes.first();
   return configuration;
 }
@@ -304,6 +307,7 @@ Configuration defaultConfiguration(const DefaultPlaces& places) {
   configuration.listener.mode = defaultMode(configuration.listener);
   configuration.storage.directory = places.storageDirectory;
   configuration.storage.root = configuration.storage.directory / "root";
+  // Before the tables that may replace them, and after the storage, whose directory they are in.
   setDefaultDirectories(configuration);
   return configuration;
 }

@@ -124,6 +124,8 @@ void BusConnection::handleFrame(const FrameBuffer::Next& next) {
 void BusConnection::handleOversized(const FrameBuffer::Next& next) {
   const std::vector<std::byte> header = FrameBuffer::withoutBody(next);
   const std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(header);
+  // If the header cannot be read, the sender is not known and gets no answer. A bus does not
+  // forward such messages.
   if (const auto* frame = std::get_if<dbus::Frame>(&read); frame != nullptr) {
     senderNamed(frame->header.sender)->receiveOversized(next);
   }
@@ -132,7 +134,7 @@ void BusConnection::handleOversized(const FrameBuffer::Next& next) {
 void BusConnection::handleSignal(const dbus::Frame& frame) {
   const dbus::MessageHeader& header = frame.header;
   const bool isFromBus = header.sender == bus_names::kBus && header.interface == bus_names::kBus;
-  // Any sender can send such a signal to our name. Only the bus knows who has left.
+  // Any sender can send such a signal to our name. Only the bus knows which one has left.
   if (!isFromBus || header.member != "NameOwnerChanged") return;
   std::vector<Value> names;  // the name, its old owner, its new one
   if (dbus::decodeBody(frame, "sss", names).has_value() || !names[2].string().empty()) return;

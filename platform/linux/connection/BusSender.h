@@ -36,7 +36,7 @@ class BusSender final : public ClientConnection, private DeadlineOwner {
   void receiveOversized(const FrameBuffer::Next& next);
   // Delivers what has been received, unless flow control holds the sender back.
   void deliverReceived();
-  // The bus has answered who the sender is, or has not answered in time.
+  // The bus has given the sender's credentials, or has not answered in time.
   void onCredentials(const PeerCredentials& credentials);
   // The bus says that the name has no owner any more.
   void onVanished();

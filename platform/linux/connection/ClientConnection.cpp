@@ -104,8 +104,8 @@ ClientConnection::Step ClientConnection::deliverFrame(const FrameBuffer::Next& n
   return hasEnded() ? Step::kStop : Step::kGoOn;
 }
 
-// Reads the header alone, as that of a message without a body, to learn whom to answer. The body is
-// dropped as it arrives and never held in memory.
+// Reads the header alone, as that of a message without a body, to find out what to answer. The body
+// is dropped as it arrives and never held in memory.
 void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
   const std::vector<std::byte> header = FrameBuffer::withoutBody(next);
   const std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(header);

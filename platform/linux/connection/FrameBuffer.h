@@ -63,7 +63,7 @@ class FrameBuffer {
   // Adds bytes from elsewhere. Not between readInto() and settle().
   void append(std::span<const std::byte> bytes);
 
-  // All that is there, whatever it is.
+  // All bytes that are not used up, whether or not they are a frame.
   [[nodiscard]] std::span<const std::byte> unused() const { return view_; }
   // What comes next. Points into this buffer: valid until it is changed.
   [[nodiscard]] Next next() const;

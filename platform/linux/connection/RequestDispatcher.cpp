@@ -189,8 +189,8 @@ void RequestDispatcher::answerStandard(const Request& request, const StandardMet
 // False when the request was refused or the client disconnected.
 bool RequestDispatcher::decode(const Request& request, std::string_view signature) {
   const dbus::MessageHeader& header = request.header();
-  // The socket is read without ancillary data, so the kernel has closed the descriptors. The
-  // message cannot mean without them what its sender meant.
+  // The socket is read without ancillary data, so the kernel has closed the descriptors.
+  // Without them the message is not what its sender meant.
   if (header.unixFds != 0) {
     request.client.refuse(header, Refusal::kUnsupportedValue, error_names::kInvalidArgs,
                           quoted(header.member) + ": the message has " +

@@ -170,6 +170,7 @@ void SnapshotCollector::addPart(const char* name, const std::function<Finding()>
     failure_ = "the service is ending";
     return;
   }
+  // The manifest must fit in the end, or nobody would know what is missing.
   if (finding.isCollected() && archive_.roomLeft() < finding.bytes.size() + kRoomForManifest) {
     finding = Finding::failed("the size limit of the archive was reached");
   }

@@ -64,7 +64,7 @@ class DispatchThread {
   }
 
   [[nodiscard]] bool isHoldingPool() const { return isHoldingPool_; }
-  // Whoever holds the pool must not wait for anything that it handed to the pool: the pool has not
+  // A thread that holds the pool must not wait for anything that it gave to the pool, which has not
   // been woken for it.
   void holdPool() { isHoldingPool_ = true; }
   // Begins the noted turns, in the order of the notes.
@@ -73,7 +73,7 @@ class DispatchThread {
 
  private:
   const DispatchQueue* queue_ = nullptr;
-  std::string_view label_;  // owned by whoever made the innermost Working
+  std::string_view label_;  // owned by the maker of the innermost Working
   bool isHelping_ = false;
   bool isHoldingPool_ = false;
   // Both keep their capacity from batch to batch.

@@ -24,7 +24,8 @@ void DispatchWaits::begin(std::shared_ptr<SharedQueue> queue,
     const MutexLock lock(mutex_);
     outcome = tryEnd(semaphore, timeout, wait);
   }
-  // Outside the lock: resume() takes the queue's, and one lock at a time leaves no order to keep.
+  // Outside the lock: resume() takes the lock of the queue, and holding one at a time needs no
+  // order.
   if (outcome.has_value()) resume(std::move(wait), *outcome);
 }
 

@@ -77,8 +77,8 @@ class DispatchWaits {
   std::unordered_set<std::shared_ptr<SharedSemaphore>> semaphores_ HALVOX_GUARDED_BY(mutex_);
 };
 
-// The signals that nobody has consumed yet, and the waits for the next ones. Shared by whoever
-// signals and whoever waits. Any thread may call.
+// The signals that no wait has consumed yet, and the waits for the next ones. Shared by the code
+// that signals and the code that waits. Any thread may call.
 class SharedSemaphore final : public DispatchSemaphore,
                               public std::enable_shared_from_this<SharedSemaphore> {
  public:

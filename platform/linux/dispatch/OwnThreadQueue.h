@@ -96,8 +96,8 @@ class OwnThreadQueue final : public DispatchQueue,
   Condition ended_;
   std::vector<Item> waiting_ HALVOX_GUARDED_BY(mutex_);
   bool hasWorker_ HALVOX_GUARDED_BY(mutex_) = false;
-  // The own thread waits, and nobody has woken it yet. Whoever wakes it clears this first, so many
-  // jobs cost one wake-up.
+  // The own thread waits and has not been woken yet. The thread that wakes it clears this first:
+  // many jobs cost one wake-up.
   bool sleeps_ HALVOX_GUARDED_BY(mutex_) = false;
   Life life_ HALVOX_GUARDED_BY(mutex_) = Life::kOpen;
   bool hasEnded_ HALVOX_GUARDED_BY(mutex_) = false;

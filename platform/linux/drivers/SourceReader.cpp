@@ -124,11 +124,11 @@ void SourceReader::makeReadings() {
     // for a late source.
     if (time <= longestWait_) isLate_ = false;
     lastMade_ = lastBegun_;
-    // Also for those who wait for the next reading: it will replace this one.
+    // Also for threads that wait for the next reading: it will replace this one.
     if (waiting_ > 0) std::swap(handedOver_, reading);
     made_.notifyAll();
     mutex_.unlock();
-    // Releasing a reading may call the source, which must not delay those who ask.
+    // Releasing a reading may call the source, which must not delay threads that ask.
     reading.reset();
     if (isSample) source_->sampled();
     mutex_.lock();

@@ -39,7 +39,7 @@ class LogMemory {
   // `bounds.bytes`. Ignores `entry.text`. The names in the entry must live as long as the log.
   void add(const LogEntry& entry, std::string_view line);
   // The kept lines, oldest first. Copies them under the lock and formats the copies after it, so
-  // that a capture does not delay those who log.
+  // that a capture does not delay threads that log.
   [[nodiscard]] Contents contents() const;
 
  private:

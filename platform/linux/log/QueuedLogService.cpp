@@ -15,6 +15,7 @@ namespace halvox::platform::linux_ {
 class QueuedLogService::Category final : public LogCategory {
  public:
   Category(QueuedLogService& service, std::string subsystem, std::string category)
+      // A line is wanted if it is to be written or to be kept.
       : LogCategory(std::min(service.levels_.written,
                              service.levels_.kept.value_or(service.levels_.written))),
         service_(service),
@@ -117,6 +118,7 @@ void QueuedLogService::reportLosses() {
                        .category = "log",
                        .text = std::move(text),
                        .wholeLength = length};
+  // Past the queue, which may be full again.
   sink_->write({&entry, 1});
 }
 

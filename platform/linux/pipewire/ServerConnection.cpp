@@ -30,6 +30,7 @@ bool ServerConnection::connect(pw_properties* properties) {
 
 void ServerConnection::disconnect() {
   if (core_ == nullptr) return;
+  // Each hook before the object that it is in, and the registry before the core that it came from.
   spa_hook_remove(&registryHook_);
   registry_.reset();
   spa_hook_remove(&coreHook_);
@@ -46,12 +47,15 @@ void ServerConnection::onCoreInfo(void* data, const pw_core_info* info) {
 
 void ServerConnection::onCoreDone(void* data, std::uint32_t id, int sequence) {
   auto* self = static_cast<ServerConnection*>(data);
+  // Answers to earlier requests are not meant.
   if (id == PW_ID_CORE && sequence == self->request_) self->listener_.onAnswered();
 }
 
 void ServerConnection::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
                                    const char* message) {
   auto* self = static_cast<ServerConnection*>(data);
+  // EPIPE at the core is how the library reports the end of the connection. Any other error is
+  // about one object.
   if (id != PW_ID_CORE || result != -EPIPE) {
     if (result != -ENOENT) self->listener_.onRefused(id, message);
     return;

@@ -58,6 +58,7 @@ Value toValue(const toml::node& node) {
   if (const auto* number = node.as_floating_point()) return number->get();
   if (const auto* flag = node.as_boolean()) return flag->get();
   if (const auto* table = node.as_table()) return toDictionary(*table);
+  // Property lists have no time without a date.
   if (const auto* time = node.as_time()) return toText(time->get());
   if (const auto* date = node.as_date()) return toDate(date->get(), {}, nullptr);
   if (const auto* moment = node.as_date_time()) {

@@ -40,6 +40,7 @@ void AnalyticsRecords::add(double time, std::string_view name, AnalyticsPayloadB
     event.ownName = std::make_unique<EventName>(name, true);
     event.name = event.ownName.get();
   }
+  // Before the wait for room, so that the counts show what waits.
   counters_.addReceived();
   if (!queue_.add([&] { queued_.push_back(std::move(event)); })) {
     counters_.addDropped(DropReason::kClosed, 1);

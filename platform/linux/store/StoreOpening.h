@@ -31,7 +31,7 @@ struct StoreSizes {
                                                           Database& database);
 
 // Closes a database without copying its write-ahead log into it, so that damaged files stay as
-// they are for whoever examines them. Does nothing when the database is not open.
+// they are and can be examined. Does nothing when the database is not open.
 void abandon(Database& database);
 
 // Returns true when the code says that the content of the file is broken.

@@ -48,7 +48,7 @@ class ResultsFile final : public Sswriter {
   [[nodiscard]] std::optional<Error> begin(const RootedDirectory::Place& place, std::string name) {
     name_ = std::move(name);
     path_ = place.text() + (place.path.ends_with('/') ? "" : "/") + name_;
-    // The file gets its name only at the end. A name that cannot be is an error now.
+    // The file gets its name only at the end. An impossible name is reported now, before the trace.
     if (name_.empty() || name_ == "." || name_ == "..") return fileError("create", path_, EINVAL);
     RootedDirectory directory = RootedDirectory::open(place);
     if (directory.error.has_value()) return std::move(directory.error);

@@ -44,6 +44,8 @@ class NoKtraceService final : public KtraceService {
   int ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) override {
     const auto ours = own(session, State::kMade);
     if (ours == nullptr || queue == nullptr) return kNoTracer;
+    // Although this returns an error: the caller ends what it has started, and waits for the
+    // completion.
     ours->state = State::kStarted;
     ours->queue = std::move(queue);
     return kNoTracer;

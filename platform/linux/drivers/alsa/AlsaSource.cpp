@@ -81,7 +81,7 @@ std::shared_ptr<const Reading> AlsaSource::read() {
 }
 
 // If several cards have the same name, the later ones get their number. A card keeps its name when
-// another one disappears, because it is still the same card and its counts go on.
+// another one disappears, because it is still the same card and its counts continue.
 std::string AlsaSource::nameFor(const std::string& folder, const std::string& name,
                                 unsigned number) {
   const auto known = cardNames_.find(folder);

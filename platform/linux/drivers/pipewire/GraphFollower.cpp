@@ -127,6 +127,7 @@ bool GraphFollower::isLeased() {
 }
 
 void GraphFollower::proceed() {
+  // A timer that is still set would cause a second attempt.
   proceedAfter(std::nullopt);
   const bool isWanted = isLeased();
   // First: until it is disconnected, everything below would use the connection that has ended.
@@ -138,7 +139,7 @@ void GraphFollower::proceed() {
     }
     return;
   }
-  // Once without anybody who wants it: channels are found at the start, when no session runs yet.
+  // Once although no session wants it: channels are found at the start, when no session runs yet.
   if (!server_.isConnected() && (isWanted || !isTried_)) lookForServer();
   // Nothing wakes this thread while no session runs or the server is connected.
   if (server_.isConnected() || !isWanted) watch_.end();
@@ -172,6 +173,7 @@ void GraphFollower::disconnect() {
   if (!server_.isConnected()) return;
   updateProfiler(false);
   profilerID_.reset();
+  // Bindings before the connection, which they use to release the server's objects.
   nodes_.clear();
   server_.disconnect();
   settle();
@@ -217,6 +219,7 @@ void GraphFollower::updateProfiler(bool isWanted) {
 }
 
 void GraphFollower::onProfile(const spa_pod* profile) {
+  // Decoded before the lock, for which readings may wait.
   const auto cycles = pipewire::decodeProfile(profile);
   const MutexLock lock(graph_.mutex);
   for (const pipewire::ProfiledCycle& cycle : cycles) graph_.statistics.cycleEnded(cycle);

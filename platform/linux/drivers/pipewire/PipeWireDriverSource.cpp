@@ -114,6 +114,7 @@ class PipeWireDriverSource::Impl {
     if (!connection_->isUsable()) return false;
     event_ = pw_loop_add_event(loop, &Impl::onRing, this);
     if (event_ == nullptr || pw_thread_loop_start(loop_) != 0) return false;
+    // Last: only a loop that runs can be woken.
     bell_->install(loop, event_);
     return true;
   }

@@ -25,7 +25,7 @@ bool isModuleThere() {
 
 }  // namespace
 
-// What readings hold that were made before the module was loaded. A session that holds one of them
+// Held by readings that were made before the module was loaded. A session that holds one of them
 // then holds a reading of the loaded source too, which follows the server as long as one is held.
 struct PipeWireOnDemand::Lease {
   std::shared_ptr<const Reading> ofLoaded;

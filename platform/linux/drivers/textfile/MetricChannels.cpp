@@ -112,6 +112,8 @@ class ChannelMaker {
   // The counters of a state set become part of its channel, not channels of their own.
   void claimStateCounters(const MetricFamily& family) {
     if (family.type != MetricType::kStateset) return;
+    // A counter that is missing claims null, which is no family's address. addStateChannel()
+    // reports it.
     claimed_[counterNamed(family.name + "_residency")] = true;
     claimed_[counterNamed(family.name + "_transitions")] = true;
   }
@@ -285,6 +287,7 @@ void ChannelMaker::addStateChannel(const MetricFamily& family, const MetricLabel
       refuse(sample->line, "expected 0 or 1 as the value of a state");
     }
     channel.description.states.push_back(labelOf(*sample, family.name));
+    // In this order, in which readings hold the numbers of a state.
     channel.values.push_back(stateCount(*transitions, *sample));
     channel.values.push_back(stateCount(*residency, *sample));
   }

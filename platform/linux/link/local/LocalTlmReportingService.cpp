@@ -63,6 +63,7 @@ TLMReportingService::Session LocalTlmReportingService::TLMReportingCreateSession
 
 void LocalTlmReportingService::TLMReportingStartConfiguration(const Session& /*session*/,
                                                               BackendsCallback found) {
+  // On another thread: the port promises that `found` is not called inside this call.
   callbacks_.call([found = std::move(found)] { found(Array{kBackendName}); });
 }
 
@@ -73,6 +74,7 @@ TLMReportingOutcome LocalTlmReportingService::TLMReportingSendMessage(
 
 void LocalTlmReportingService::TLMReportingFlushMessages(const Session& /*session*/,
                                                          std::function<void()> flushed) {
+  // Nothing to wait for: the store's writer has the messages and commits them within half a second.
   flushed();
 }
 

@@ -25,6 +25,7 @@ TLMReportingService::Session NoneTlmReportingService::TLMReportingCreateSession(
 
 void NoneTlmReportingService::TLMReportingStartConfiguration(const Session& /*session*/,
                                                              BackendsCallback found) {
+  // On another thread: the port promises that `found` is not called inside this call.
   callbacks_.call([found = std::move(found)] { found(std::nullopt); });
 }
 

@@ -13,7 +13,7 @@ class BurstLog {
  public:
   using Time = std::chrono::steady_clock::time_point;
 
-  // Adds failures. Returns how many the caller shall log now; none for no line.
+  // Adds failures. Returns how many the caller shall log now; std::nullopt if it shall log nothing.
   [[nodiscard]] std::optional<std::uint64_t> note(std::uint64_t failures, Time now) {
     unlogged_ += failures;
     if (last_ && now - *last_ < kPause) return std::nullopt;

@@ -52,7 +52,7 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
   }
   if (!failure.empty()) kLog.error("a session starts without NATS servers: ", failure);
   if (waiter == 0) {
-    // No thread of ours to call back on.
+    // There is no thread of ours to call back on.
     return dispatch_.asyncAfterOnBackgroundQueue(
         std::chrono::nanoseconds(0), [found = std::move(found)] { found(std::nullopt); });
   }
@@ -305,7 +305,7 @@ void NatsLink::end() {
   changed_.notifyAll();
 }
 
-// Calls back everybody who asked: with the servers, or with nothing when none is connected.
+// Calls back all callers of discover(): with the servers, or with nothing when none is connected.
 void NatsLink::answerWaiters() {
   std::vector<Waiter> waiters;
   std::optional<Array> servers;

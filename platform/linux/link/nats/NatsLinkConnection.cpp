@@ -19,7 +19,7 @@ constexpr std::chrono::milliseconds kShortestServerTime{100};
 constexpr std::chrono::milliseconds kServersTime{6000};
 constexpr std::chrono::milliseconds kRequestTime{750};
 static_assert(kServersTime + 2 * kRequestTime < NatsLink::kDiscoveryTime);
-// A server that does not read for this long is treated as gone; close() can wait for one write.
+// A server that does not read for this long counts as disconnected. close() can wait for one write.
 constexpr std::chrono::milliseconds kWriteTime{2000};
 // Reconnects quickly after a restart of a server; the jitter spreads the services of a fleet.
 constexpr std::chrono::milliseconds kReconnectPause{250};
@@ -143,6 +143,7 @@ void NatsLink::connect() {
   }
   NatsConnection connection;
   JetStreamContext context;
+  // Without the lock, because this can take seconds. Callers only queue meanwhile.
   const std::string failure = open(connection, context);
   if (!failure.empty()) {
     if (connection) natsConnection_Close(connection.get());

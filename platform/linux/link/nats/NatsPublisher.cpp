@@ -84,6 +84,7 @@ void NatsPublisher::abandonAll() {
     lost = pending_.takeAll();
     unsent = takeQueue();
   }
+  // Without the lock: the ledger may call back a flush, which may send.
   abandon(lost, "the connection ended");
   fail(unsent, "the service ended");
 }
@@ -350,6 +351,7 @@ void NatsPublisher::settle(const PendingAcks::Entry& entry, const jsPubAckErr* e
   } else {
     const std::string_view reason = natsStatus_GetText(error->Err);
     countFailure(1, error->ErrText != nullptr ? error->ErrText : reason);
+    // Looked up by name: there are many reasons, and failures are rare.
     statistics_.counter(kNatsPiece, std::string("failed: ") + std::string(reason)).add();
   }
   if (!entry.ledger) return;

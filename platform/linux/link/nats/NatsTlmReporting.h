@@ -18,10 +18,11 @@ struct NatsEnvironment {
 // The real-time reporting framework over NATS with JetStream.
 class NatsTlmReporting : public TLMReportingService {
  public:
-  // Refuses further messages, publishes for up to 3 seconds what was accepted, calls back everybody
-  // who still waits, and ends the connection. Blocks, for at most about 10 seconds; call it when no
-  // other thread uses the back-end. Returns false if a thread still waits for a server, which the
-  // NATS client library cannot interrupt: the environment must then stay until the process ends.
+  // Refuses further messages, publishes for up to 3 seconds what was accepted, calls back all
+  // callers that still wait, and ends the connection. Blocks for at most about 10 seconds. Call it
+  // when no other thread uses the back-end. Returns false if a thread still waits for a server,
+  // which the NATS client library cannot interrupt: the environment must then stay until the
+  // process ends.
   [[nodiscard]] virtual bool close() = 0;
 };
 

@@ -159,6 +159,7 @@ LttngControl::Failure LttngControl::setUp(const RecordingPlan& plan, const Recor
   if (!failure) failure = addContexts(handle.get());
   if (!failure) failure = addEvent(handle.get(), plan);
   if (!failure) failure = check(::lttng_start_tracing(name), "start the session");
+  // Nothing was recorded whose end would have to be awaited.
   if (failure) static_cast<void>(::lttng_destroy_session_no_wait(name));
   return failure;
 }
@@ -166,6 +167,7 @@ LttngControl::Failure LttngControl::setUp(const RecordingPlan& plan, const Recor
 LttngControl::Failure LttngControl::end(const Recording& recording) {
   const MutexLock lock(mutex_);
   std::error_code ignored;
+  // First: the file promises that events are recorded.
   std::filesystem::remove(recordingDirectory_ / recording.name, ignored);
   const char* const name = recording.name.c_str();
   // Both calls wait until the recording is on the disk. Both are made whatever the first returns.

@@ -77,6 +77,7 @@ class Sink {
     bt_message_array_const messages = nullptr;
     std::uint64_t count = 0;
     const auto status = bt_message_iterator_next(iterator, &messages, &count);
+    // babeltrace gives the statuses of both functions the same numbers.
     if (status != BT_MESSAGE_ITERATOR_NEXT_STATUS_OK) return static_cast<Status>(status);
     auto& self = *static_cast<Sink*>(sink);
     for (std::uint64_t index = 0; index < count; ++index) {
@@ -163,6 +164,7 @@ std::string latestError() {
 
 // The directories of traces: each has a file "metadata".
 std::vector<std::string> traceDirectories(const std::filesystem::path& root) {
+  // LTTng writes a trace of its own for each user and word size, in directories below the root.
   std::vector<std::string> directories;
   std::error_code error;
   std::filesystem::recursive_directory_iterator entry(root, error);
@@ -187,6 +189,7 @@ class TraceGraph {
     const auto* const filter =
         bt_plugin_borrow_filter_component_class_by_name_const(utils_.get(), "muxer");
     if (filter == nullptr) return false;
+    // Without a level of its own, the library would write to standard error.
     if (bt_graph_add_filter_component(graph_.get(), filter, "muxer", nullptr, BT_LOGGING_LEVEL_NONE,
                                       &muxer_) != BT_GRAPH_ADD_COMPONENT_STATUS_OK) {
       return false;
@@ -199,6 +202,8 @@ class TraceGraph {
 
  private:
   static bool find(const char* name, Plugin& plugin) {
+    // Not in the user's directory of plugins, and without a failure because of some other plugin
+    // that cannot be loaded.
     return bt_plugin_find(name, BT_TRUE, BT_FALSE, BT_TRUE, BT_TRUE, BT_FALSE, plugin.out()) ==
            BT_PLUGIN_FIND_STATUS_OK;
   }
