@@ -241,7 +241,7 @@ TEST(AudioIssueDetectedTest, AnUnknownFieldThatCannotBeSkippedIsAnError) {
   EXPECT_EQ(issue.duration(), 12);
 }
 
-TEST(AudioIssueDetectedTest, TheFieldNumberDecidesWhateverTheWireType) {
+TEST(AudioIssueDetectedTest, TheWireTypeOfAKnownFieldIsNotChecked) {
   const AudioIssueDetected issue =
       readOrFail({0x0D, 0x2A, 0x15, 0x05, 0x18, 0x01, 'g', 0x23, 0x01, 'm', 0x29, 0x01, 'x'});
 

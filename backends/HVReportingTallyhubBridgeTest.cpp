@@ -197,7 +197,7 @@ TEST_F(HVReportingTallyhubBridgeTest, EventsNotYetBuiltHoldTheSession) {
   EXPECT_TRUE(platform_.analytics.events().back().payload.has_value());
 }
 
-TEST_F(HVReportingTallyhubBridgeTest, NamesThatNobodyUsesHoldNothing) {
+TEST_F(HVReportingTallyhubBridgeTest, UnusedNamesHoldNothing) {
   platform_.analytics.wantOnly({});
   const std::weak_ptr<HVReportingSession> session = session_;
   handle(Dictionary{});

@@ -24,7 +24,7 @@ std::string written(const Value& only, const Value& digits) { return bucket(0, {
 
 // --- Rounding -----------------------------------------------------------------------------------
 
-TEST(HVReportingUtilityRoundWithPlacesTest, HalvesGoAwayFromZero) {
+TEST(HVReportingUtilityRoundWithPlacesTest, HalvesRoundAwayFromZero) {
   EXPECT_EQ(HVReportingUtilityRoundWithPlaces(2.5, 0), 3.0);
   EXPECT_EQ(HVReportingUtilityRoundWithPlaces(-2.5, 0), -3.0);
   EXPECT_EQ(HVReportingUtilityRoundWithPlaces(-0.125, 2), -0.13);
@@ -86,7 +86,7 @@ TEST(HVReportingUtilityBucketTest, WithoutBucketsThereIsNone) {
   EXPECT_EQ(HVReportingUtilityBucketNumberToString(1, {}, 2), std::nullopt);
 }
 
-TEST(HVReportingUtilityBucketTest, DistancesAreThoseOfDoublesWhateverTheNumbersAre) {
+TEST(HVReportingUtilityBucketTest, DistancesAreComputedWithDoubles) {
   EXPECT_EQ(bucket(true, {0, 1.0F, std::uint8_t{2}}, 0), "1");
   EXPECT_EQ(bucket(0.9, {0.5, 1, 2}, 1), "1.0");
 }

@@ -36,7 +36,7 @@ TEST_F(HVReportingInternalBuildAnswerTest, IsFalseWhenTheDeviceHasNoAnswer) {
   EXPECT_FALSE(HVReportingInternalBuildAnswer().isInternalBuild());
 }
 
-TEST_F(HVReportingInternalBuildAnswerTest, IsFalseWhenTheAnswerIsNoBoolean) {
+TEST_F(HVReportingInternalBuildAnswerTest, IsFalseWhenTheAnswerIsNotABoolean) {
   EXPECT_FALSE(answerWith("true"));
   EXPECT_FALSE(answerWith(1));
   EXPECT_FALSE(answerWith(platform::Dictionary{{"true", true}}));

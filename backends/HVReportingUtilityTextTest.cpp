@@ -112,7 +112,7 @@ TEST(HVReportingUtilityCategoryStringTest, SessionPlaybackIsJoinedWithAnUndersco
   EXPECT_EQ(categoryText(0x80000000 | 11), "Toolbox_Error");
 }
 
-TEST(HVReportingUtilityCategoryStringTest, HighBitsThatAreNoSingleDomainGiveTheUnderscoreAlone) {
+TEST(HVReportingUtilityCategoryStringTest, HighBitsThatAreNotOneDomainGiveTheUnderscoreAlone) {
   EXPECT_EQ(categoryText(0x0C000001), "_Generic");  // two domains at once
   EXPECT_EQ(categoryText(0x00030002), "_Record");
   EXPECT_EQ(categoryText(0x00020000), "_Undefined");

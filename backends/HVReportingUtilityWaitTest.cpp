@@ -111,7 +111,7 @@ TEST_F(HVReportingUtilityWaitTest, AWakeUpWithoutTheFlagWaitsAgain) {
   EXPECT_EQ(texts[2], "waiting for it");
 }
 
-TEST_F(HVReportingUtilityWaitTest, EachWakeUpGrantsTheWholeTimeoutAnew) {
+TEST_F(HVReportingUtilityWaitTest, EachWakeUpRestartsTheTimeout) {
   bool result = false;
   std::jthread waiter([this, &result] { result = wait(1.0); });
   const auto end = std::chrono::steady_clock::now() + 1.5s;

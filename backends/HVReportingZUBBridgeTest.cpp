@@ -107,7 +107,7 @@ TEST_F(HVReportingZUBBridgeTest, NoMessageIsIgnored) {
   EXPECT_THAT(platform_.log.lines(), IsEmpty());
 }
 
-TEST_F(HVReportingZUBBridgeTest, ValuesThatAreNoTextsArePostedAsTheyAreDescribed) {
+TEST_F(HVReportingZUBBridgeTest, ValuesOtherThanTextsArePostedAsTheirDescriptions) {
   EXPECT_EQ(nodeOf(3), "3");
   EXPECT_EQ(nodeOf(0.5), "0.5");
   EXPECT_EQ(nodeOf("m\xC3\xA9langeur"), "m\xC3\xA9langeur");

@@ -112,7 +112,7 @@ TEST_F(HVReportingDriverChannelTest, SimpleChannelThatDidNotGrowIsDropped) {
 
 // --- Histogram ----------------------------------------------------------------------------------
 
-TEST_F(HVReportingDriverChannelTest, HistogramTellsItsHitBucketsAndItsBounds) {
+TEST_F(HVReportingDriverChannelTest, HistogramReportsItsHitBucketsAndItsBounds) {
   EXPECT_EQ(histogram({{0, 10, 5}, {10, 20, 0}, {20, 30, 2}}),
             (Dictionary{{"AmpDriver_Haptics_Stats_Histogram_PeakLevel",
                          "count=3,lower=0,upper=30,min=1,max=27,unit=ms::0-10:5;20-30:2"}}));
@@ -156,7 +156,7 @@ TEST_F(HVReportingDriverChannelTest, HistogramNumbersAreSigned) {
 
 // --- State --------------------------------------------------------------------------------------
 
-TEST_F(HVReportingDriverChannelTest, StateChannelTellsTheStatesThatHeld) {
+TEST_F(HVReportingDriverChannelTest, StateChannelReportsTheStatesWithResidency) {
   const std::string text =
       "name:running,transition:2,residency:300,duty_cycle:0.750000;"
       "name:idle,transition:1,residency:100,duty_cycle:0.250000;";

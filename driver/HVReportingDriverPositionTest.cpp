@@ -43,7 +43,7 @@ class HVReportingDriverPositionTest : public DriverUtilityFixture,
   }
 };
 
-TEST_P(HVReportingDriverPositionTest, AGroupWhoseChannelsCannotBeFoundIsLeftOut) {
+TEST_P(HVReportingDriverPositionTest, AGroupWhoseChannelsCannotBeFoundIsSkipped) {
   platform_.ioReport.failChannels(failing(), {-4});
 
   const HVReportingDriverUtility utility;
@@ -52,7 +52,7 @@ TEST_P(HVReportingDriverPositionTest, AGroupWhoseChannelsCannotBeFoundIsLeftOut)
   EXPECT_EQ(lines(LogLevel::kError), Texts{"error -4 getting channels for driver " + failing()});
 }
 
-TEST_P(HVReportingDriverPositionTest, AFailingSubscriptionIsLeftOut) {
+TEST_P(HVReportingDriverPositionTest, AFailingSubscriptionIsSkipped) {
   platform_.ioReport.failSubscription(failing(), {-5});
 
   const HVReportingDriverUtility utility;
@@ -61,7 +61,7 @@ TEST_P(HVReportingDriverPositionTest, AFailingSubscriptionIsLeftOut) {
   EXPECT_EQ(lines(LogLevel::kError), Texts{"error -5 creating subscription for " + failing()});
 }
 
-TEST_P(HVReportingDriverPositionTest, AFailingSnapshotIsLeftOutAndTheRestIsReported) {
+TEST_P(HVReportingDriverPositionTest, AFailingSnapshotIsSkippedAndTheRestIsReported) {
   const auto utility = makeUtility();
   platform_.ioReport.failSamples(failing(), {-6});
 
@@ -72,7 +72,7 @@ TEST_P(HVReportingDriverPositionTest, AFailingSnapshotIsLeftOutAndTheRestIsRepor
   EXPECT_EQ(lines(LogLevel::kError), Texts{"IOReportCreateSamples error -6"});
 }
 
-TEST_P(HVReportingDriverPositionTest, AFailingSampleAtTheStopIsLeftOutAndTheRestIsReported) {
+TEST_P(HVReportingDriverPositionTest, AFailingSampleAtTheStopIsSkippedAndTheRestIsReported) {
   const auto utility = makeUtility();
   session_->setDriverSnapShot(utility.getSnapShot());
   setAll(2);
@@ -96,7 +96,7 @@ TEST_P(HVReportingDriverPositionTest, AFailingDeltaIsLoggedLikeASampleAndTheRest
   EXPECT_EQ(lines(LogLevel::kError), Texts{"IOReportCreateSamples error -8"});
 }
 
-TEST_P(HVReportingDriverPositionTest, ASubscriptionThatFailsWithoutAnErrorIsLeftOutSilently) {
+TEST_P(HVReportingDriverPositionTest, ASubscriptionThatFailsWithoutAnErrorIsSkippedSilently) {
   platform_.ioReport.failSubscription(failing(), {});
 
   const HVReportingDriverUtility utility;
@@ -105,7 +105,7 @@ TEST_P(HVReportingDriverPositionTest, ASubscriptionThatFailsWithoutAnErrorIsLeft
   EXPECT_TRUE(lines(LogLevel::kError).empty());
 }
 
-TEST_P(HVReportingDriverPositionTest, FailuresWithoutAnErrorSayNothing) {
+TEST_P(HVReportingDriverPositionTest, FailuresWithoutAnErrorAreNotLogged) {
   platform_.ioReport.failDelta(failing(), {});
   const auto utility = makeUtility();
   session_->setDriverSnapShot(utility.getSnapShot());

@@ -72,7 +72,7 @@ TEST_F(HVReportingDriverUtilityTest, AnErrorBesideChannelsIsLoggedAndTheChannels
   EXPECT_EQ(utility.ioChannelSubscriptions().size(), 1U);
 }
 
-TEST_F(HVReportingDriverUtilityTest, NoChannelsWithoutAnErrorSayNothing) {
+TEST_F(HVReportingDriverUtilityTest, NoChannelsWithoutAnErrorAreNotLogged) {
   platform_.ioReport.failChannels("Rx-(null)", {});
 
   const HVReportingDriverUtility utility;
@@ -120,7 +120,7 @@ TEST_F(HVReportingDriverUtilityTest, WithoutASnapshotSamplesAreTakenButNothingIs
   EXPECT_TRUE(recorded().empty());
 }
 
-TEST_F(HVReportingDriverUtilityTest, AFailingSampleIsToldAfterTheSamplingIsOver) {
+TEST_F(HVReportingDriverUtilityTest, AFailingSampleIsLoggedAfterTheSampling) {
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
   const auto utility = makeUtility();
   platform_.ioReport.failSamples("Speaker-(null)", {-6});
@@ -223,7 +223,7 @@ TEST_F(HVReportingDriverUtilityTest, SessionsAtOnceEachHaveTheirOwnSnapshot) {
   EXPECT_EQ(recorded()[0].find("Amp_Speaker_Simple_a")->toInt64(), 2);
 }
 
-TEST_F(HVReportingDriverUtilityTest, GroupThatIsNotInTheSnapshotIsLeftOutSilently) {
+TEST_F(HVReportingDriverUtilityTest, GroupThatIsNotInTheSnapshotIsSkippedSilently) {
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
   const auto utility = makeUtility();
   session_->setDriverSnapShot(DriverSnapShot{});

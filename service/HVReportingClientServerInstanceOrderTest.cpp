@@ -101,7 +101,7 @@ TEST_F(HVReportingClientServerInstanceOrderTest, SessionHasItsLinkWhenTheCreateI
 
 // The counter decides about the link before the session starts. The snapshot is taken before the
 // reply is held, and the state of the features comes last.
-TEST_F(HVReportingClientServerInstanceOrderTest, StartTakesItsStepsOneAfterTheOther) {
+TEST_F(HVReportingClientServerInstanceOrderTest, StepsOfAStartAreInOrder) {
   create();
 
   EXPECT_THAT(notesOf([this] { start(); }),
@@ -110,7 +110,7 @@ TEST_F(HVReportingClientServerInstanceOrderTest, StartTakesItsStepsOneAfterTheOt
                           "active sessions: runs, link, snapshot, held reply"));
 }
 
-TEST_F(HVReportingClientServerInstanceOrderTest, ReplyThatIsStillHeldIsGivenBeforeTheNextIsHeld) {
+TEST_F(HVReportingClientServerInstanceOrderTest, HeldReplyIsDeliveredBeforeTheNextIsHeld) {
   create();
   start();
   const auto session = client_->findReportingSessionForID(
@@ -126,7 +126,7 @@ TEST_F(HVReportingClientServerInstanceOrderTest, ReplyThatIsStillHeldIsGivenBefo
                           "active sessions: runs, link, snapshot, held reply"));
 }
 
-TEST_F(HVReportingClientServerInstanceOrderTest, StopTakesItsStepsOneAfterTheOther) {
+TEST_F(HVReportingClientServerInstanceOrderTest, StepsOfAStopAreInOrder) {
   create();
   start();
 

@@ -94,7 +94,7 @@ TEST_F(HVReportingClientServerInstanceStartStopTest, TheFifthStartedSessionGetsT
   EXPECT_EQ(delegate_->activeSessionCount(), 6);
 }
 
-TEST_F(HVReportingClientServerInstanceStartStopTest, AStartDecidesAboutTheLinkAnew) {
+TEST_F(HVReportingClientServerInstanceStartStopTest, AStartDecidesAboutTheLinkAgain) {
   create(client_, 7);
   EXPECT_TRUE(sessionOf(client_, 7)->tlmReportingEnabled());
   delegate_->setActiveSessionCount(5);

@@ -177,7 +177,7 @@ TEST_F(HVReportingServiceDelegateTest, TheUptimeEventIsSentWithoutAskingWhetherI
               ElementsAre("com.tarno.halvox.hvreportingclientuptime"));
 }
 
-TEST_F(HVReportingServiceDelegateTest, AStartDateInTheFutureIsSaidToBeInThePast) {
+TEST_F(HVReportingServiceDelegateTest, AStartDateInTheFutureIsLoggedAsInThePast) {
   platform_.clock.setCurrentDate({5000});
   const Connection connection = connect(100, "player");
   platform_.clock.setCurrentDate({4990});

@@ -147,7 +147,7 @@ TEST_F(HVReportingServiceLogTest, MessageForOneSession) {
                           "debug hvrr: sending single message after delta 0 for service 65535"));
 }
 
-TEST_F(HVReportingServiceLogTest, MessageForNobody) {
+TEST_F(HVReportingServiceLogTest, MessageWithoutActiveSessions) {
   sendToAll(client_);
   platform_.analytics.buildPayloads();  // until then the builders hold the session
 

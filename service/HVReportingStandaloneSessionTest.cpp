@@ -71,13 +71,13 @@ TEST_F(HVReportingStandaloneSessionTest, BackEndsComeInTheirOrderTheBugCaptureLa
                           "com.tarno.standalone.Playback.IssueDetector", "5963779", "bug capture"));
 }
 
-TEST_F(HVReportingStandaloneSessionTest, NoMessageAtAllGetsNoStamps) {
+TEST_F(HVReportingStandaloneSessionTest, ANullMessageGetsNoStamps) {
   sendToNobody(std::nullopt);
 
   EXPECT_THAT(delegate_->messages, ElementsAre(std::nullopt));
 }
 
-TEST_F(HVReportingStandaloneSessionTest, IsMadeAnewForEachMessage) {
+TEST_F(HVReportingStandaloneSessionTest, IsCreatedForEachMessage) {
   sendToNobody();
   sendToNobody();
 

@@ -17,7 +17,7 @@ class NSUserDefaultsTest : public testing::Test {
   NSUserDefaults defaults_{"suite"};
 };
 
-TEST_F(NSUserDefaultsTest, AnAbsentKeyIsNoObjectNoStringAndFalse) {
+TEST_F(NSUserDefaultsTest, AnAbsentKeyHasNeitherObjectNorStringAndIsFalse) {
   EXPECT_EQ(defaults_.objectForKey("key"), std::nullopt);
   EXPECT_EQ(defaults_.stringForKey("key"), std::nullopt);
   EXPECT_FALSE(defaults_.boolForKey("key"));

@@ -15,7 +15,7 @@ ServiceArguments parse(const std::vector<const char*>& arguments) {
   return parseServiceArguments(arguments);
 }
 
-TEST(ServiceArgumentsTest, NoneMeansToServe) { EXPECT_EQ(parse({}).request, Request::kServe); }
+TEST(ServiceArgumentsTest, NoArgumentMeansServe) { EXPECT_EQ(parse({}).request, Request::kServe); }
 
 TEST(ServiceArgumentsTest, HelpAndVersionAreKnown) {
   EXPECT_EQ(parse({"--help"}).request, Request::kShowHelp);

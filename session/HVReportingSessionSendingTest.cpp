@@ -174,7 +174,7 @@ TEST_F(HVReportingSessionSendingTest, TimeDoesNotEndARepetition) {
   EXPECT_THAT(identifiers(), ElementsAre("Playback_Start_1"));
 }
 
-TEST_F(HVReportingSessionSendingTest, KeysThatNobodyReadNeitherThrottleNorExclude) {
+TEST_F(HVReportingSessionSendingTest, UnreadKeysNeitherThrottleNorExclude) {
   const platform::Key blacklist(kHVReportingSessionBlacklistFieldsKey);
   const platform::Key throttle(kHVReportingSessionThrottleSecondsKey);
   send({{"a", 1}, {blacklist, platform::Array{"a"}}, {throttle, 3600}});

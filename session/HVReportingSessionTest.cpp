@@ -176,7 +176,7 @@ TEST_F(HVReportingSessionTest, NeverReportsOrientation) {
   EXPECT_FALSE(session->shouldReportOrientation());
 }
 
-TEST_F(HVReportingSessionTest, OffersTheKeysThatNobodyReads) {
+TEST_F(HVReportingSessionTest, OffersTheKeysThatAreNotRead) {
   EXPECT_EQ(kHVReportingSessionBlacklistFieldsKey, "_comparison_field_blacklist");
   EXPECT_EQ(kHVReportingSessionThrottleSecondsKey, "_throttle_seconds");
 }

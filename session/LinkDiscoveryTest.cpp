@@ -43,7 +43,7 @@ TEST_F(LinkDiscoveryTest, EarlyAnswerIsReportedByAQueueOfItsOwn) {
   EXPECT_EQ(platform_.dispatch.createdQueues()[0].label, "com.tarno.halvox.session.discovery");
 }
 
-TEST_F(LinkDiscoveryTest, AnswerThatNobodyAwaitsIsNotReported) {
+TEST_F(LinkDiscoveryTest, AnswerWithoutAWaitIsNotReported) {
   discovery_.answer(std::nullopt);
   platform_.dispatch.runUntilIdle();
 

@@ -42,7 +42,7 @@ TEST_F(SessionHistoryTest, RepetitionInARunIsRedundant) {
   EXPECT_EQ(history_.size(), 1U);
 }
 
-TEST_F(SessionHistoryTest, EndGivesTheHistoryAwayAndItsChargeBack) {
+TEST_F(SessionHistoryTest, EndReturnsTheHistoryAndItsCharge) {
   history_.begin();
   history_.record(kPlayback, kStart, Dictionary{{"a", 1}});
   EXPECT_GT(account_->use().bytes, 0U);

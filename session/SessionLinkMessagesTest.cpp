@@ -183,7 +183,7 @@ TEST_F(SessionLinkMessagesTest, BeforeTheStartAMessageIsASingleOne) {
 }
 
 // The state at the moment of sending decides, not the state when the job runs.
-TEST_F(SessionLinkMessagesTest, AMessageOfAStartedSessionIsNoSingleOneThoughTheStopOvertakes) {
+TEST_F(SessionLinkMessagesTest, AMessageOfAStartedSessionIsNotASingleOneEvenIfTheStopOvertakes) {
   framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
   session_->start();
   send({{"a", 1}});
@@ -275,7 +275,7 @@ TEST_F(SessionLinkMessagesTest, WhatATagReplacedIsChargedWhileItWaits) {
   EXPECT_GE(account->use().bytes, 100'000U);
 }
 
-TEST_F(SessionLinkMessagesTest, WhatWaitsStaysChargedWhenTheSessionIsStopped) {
+TEST_F(SessionLinkMessagesTest, WaitingMessagesStayChargedWhenTheSessionIsStopped) {
   const auto account = std::make_shared<ResourceAccount>();
   session_->chargeTo(account);
   holdDiscoveries();

@@ -71,7 +71,7 @@ TEST_F(SessionSummaryFileTest, IsNamedByLocalTimeApplicationAndService) {
   EXPECT_EQ(name(), "20231114-204320-0130-halvox-___.._player-telephony.json");
 }
 
-TEST_F(SessionSummaryFileTest, AnApplicationThatIsNoTextHasANameToo) {
+TEST_F(SessionSummaryFileTest, AnApplicationNameThatIsNotTextIsDescribed) {
   session_->setConfiguration(Dictionary{{"HostApplicationDisplayID", 42}});
   send({{"foo", 1}});
 

@@ -163,7 +163,7 @@ TEST_F(SessionTracingFrameworkTest, FinishedRunnerIsNotStoppedInPlaceOfTheFramew
   EXPECT_EQ(platform_.resultsFiles.files().size(), 1U);
 }
 
-TEST_F(SessionTracingFrameworkTest, ATraceThatNoStopEndedIsGivenUpForTheNextOne) {
+TEST_F(SessionTracingFrameworkTest, AnUnstoppedTraceIsReplacedByTheNextOne) {
   session_->start();
   letRun();
   chooseRunner();

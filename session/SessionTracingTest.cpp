@@ -78,7 +78,7 @@ TEST_F(SessionTracingTest, FeatureSwitchedOffMeanwhileLeavesTheTraceAlone) {
   EXPECT_TRUE(session_->tracing().startedTracing());
 }
 
-TEST_F(SessionTracingTest, SessionThatIsNoTestAnyMoreLeavesTheTraceAlone) {
+TEST_F(SessionTracingTest, SessionThatIsNoLongerATestDoesNotStopTheTrace) {
   session_->start();
   session_->setServiceType(AudioServiceType::kHaptics);
   forgetWhatHappened();

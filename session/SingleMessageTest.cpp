@@ -91,7 +91,7 @@ TEST_F(SingleMessageTest, AlarmsDrawEachSecondOfAMinute) {
   EXPECT_EQ(*deltas.rbegin(), 59);
 }
 
-TEST_F(SingleMessageTest, AlarmsWaitOneSecondWhateverTheDelta) {
+TEST_F(SingleMessageTest, AlarmsAlwaysWaitOneSecond) {
   for (int round = 0; round < 50; ++round) send(AudioServiceType::kAlarms);
 
   const auto delays = platform_.dispatch.delays();

@@ -188,7 +188,7 @@ TEST_F(VolumeMessagesTest, TheVolumeOfTheEndingMessageIsNotTheOneReported) {
   EXPECT_THAT(intervals(), ElementsAre("0.5: 10"));
 }
 
-TEST_F(VolumeMessagesTest, AVolumeWithoutAStateSaysThatNothingPlays) {
+TEST_F(VolumeMessagesTest, AVolumeWithoutAStateMeansNotPlaying) {
   playing(0.5, 10);
   add({{"RQSessionVolume", 0.5}, {"hvreporting_timestamp", 20}});
   add({{"RQSessionVolume", 0.5}, {"hvreporting_timestamp", 30}});
@@ -221,7 +221,7 @@ TEST_F(VolumeMessagesTest, AVolumeAsTextCountsAsZero) {
   EXPECT_THAT(intervals(), ElementsAre("0.5: 10", "0: 4"));
 }
 
-TEST_F(VolumeMessagesTest, AStateAsTextSaysThatNothingPlays) {
+TEST_F(VolumeMessagesTest, AStateAsTextMeansNotPlaying) {
   playing(0.5, 10);
   volumeMessage(0.5, "1", 20);
   silent(0.5, 30);
@@ -238,7 +238,7 @@ TEST_F(VolumeMessagesTest, AStateIsReadAsAnInteger) {
   EXPECT_THAT(intervals(), ElementsAre("0.5: 20"));
 }
 
-TEST_F(VolumeMessagesTest, AVolumeThatIsNoNumberAtAllIsHeldLikeOthers) {
+TEST_F(VolumeMessagesTest, AVolumeThatIsNotANumberIsHeldLikeOthers) {
   const double nan = std::numeric_limits<double>::quiet_NaN();
   playing(nan, 10);
   playing(nan, 20);
@@ -251,7 +251,7 @@ TEST_F(VolumeMessagesTest, AVolumeThatIsNoNumberAtAllIsHeldLikeOthers) {
   EXPECT_EQ(message.find("RQSessionVolumeBucketed")->kind(), ValueKind::kString);
 }
 
-TEST_F(VolumeMessagesTest, AStampThatIsNoNumberAtAllGivesNoInterval) {
+TEST_F(VolumeMessagesTest, AStampThatIsNotANumberGivesNoInterval) {
   const double nan = std::numeric_limits<double>::quiet_NaN();
   playing(0.5, nan);
   playing(0.75, 20);

@@ -97,7 +97,7 @@ TEST(CommandLineTest, ADashReadsTheDictionaryFromTheInput) {
   EXPECT_EQ(configure.configuration, (Dictionary{{"a", 1}}));
 }
 
-TEST(CommandLineTest, CommonOptionsStandBeforeOrBehindTheCommand) {
+TEST(CommandLineTest, CommonOptionsMayComeBeforeOrAfterTheCommand) {
   for (const Words& words : {Words{"--json", "--socket", "/s", "--timeout", "2", "list"},
                              Words{"list", "--json", "--socket", "/s", "--timeout", "2"}}) {
     const auto parsed = parse(words);
@@ -218,7 +218,7 @@ TEST(CommandLineTest, ErrorsNameTheCommandAndTheArgument) {
             "the end of the text");
 }
 
-TEST(CommandLineTest, CountsAndActionsThatAreNoneAreNamedWithWhatIsExpected) {
+TEST(CommandLineTest, WrongCountsAndActionsAreNamedWithWhatIsExpected) {
   for (const std::string command : {"events", "metrics", "power", "link", "snapshots", "summary"}) {
     EXPECT_EQ(
         errorOf({command, "--last", "x"}),
@@ -314,7 +314,7 @@ TEST(CommandLineTest, HelpHasNoLongLinesAndNoGaps) {
   }
 }
 
-TEST(CommandLineTest, HelpTellsOfTheSocketOnlyWhereTheServiceIsAsked) {
+TEST(CommandLineTest, HelpShowsTheSocketOnlyForRequestsToTheService) {
   for (const Words& words : {Words{}, Words{"list"}, Words{"run"}, Words{"trace", "record"}}) {
     EXPECT_NE(helpOf(words).find("--socket"), std::string::npos);
     EXPECT_NE(helpOf(words).find("--timeout"), std::string::npos);
@@ -338,7 +338,7 @@ TEST(CommandLineTest, TheShellCompletesEveryCommand) {
   }
 }
 
-TEST(CommandLineTest, HelpOnCreateTellsHowLongASessionLives) {
+TEST(CommandLineTest, HelpOnCreateSaysHowLongASessionLives) {
   const auto parsed = parse({"create", "--help"});
 
   EXPECT_NE(std::get<CommandLineText>(parsed).text.find("lives as long as the connection"),
@@ -354,7 +354,7 @@ TEST(CommandLineTest, TheHelpOfTheShellIsAboutItsLines) {
   EXPECT_NE(text.find("'quit'"), std::string::npos) << text;
 }
 
-TEST(CommandLineTest, TellsItsVersion) {
+TEST(CommandLineTest, PrintsItsVersion) {
   const auto parsed = parse({"--version"});
 
   EXPECT_EQ(std::get<CommandLineText>(parsed).text.substr(0, 10), "halvoxctl ");

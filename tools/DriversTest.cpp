@@ -111,7 +111,7 @@ TEST_F(ShowDriversTest, TheChannelsOfAGroupAreReadFromTheConfiguredSources) {
   EXPECT_EQ(out_.str(), "-  Tx  -  a  3\n");
 }
 
-TEST_F(ShowDriversTest, AGroupThatIsNotThereIsAnsweredWithThoseThatAre) {
+TEST_F(ShowDriversTest, AnUnknownGroupIsReportedWithTheExistingOnes) {
   for (const auto watch : {std::optional<std::chrono::milliseconds>(), {std::chrono::hours(1)}}) {
     errors_.str("");
     EXPECT_EQ(showDrivers({.group = "Nope", .watch = watch}, OutputForm::kText, out_, -1, errors_),
@@ -123,7 +123,7 @@ TEST_F(ShowDriversTest, AGroupThatIsNotThereIsAnsweredWithThoseThatAre) {
   EXPECT_EQ(out_.str(), "");
 }
 
-TEST_F(ShowDriversTest, WatchingEndsWhenNobodyReads) {
+TEST_F(ShowDriversTest, WatchingEndsWhenTheOutputIsClosed) {
   int ends[2];
   ASSERT_EQ(pipe(ends), 0);
   close(ends[0]);
@@ -136,7 +136,7 @@ TEST_F(ShowDriversTest, WatchingEndsWhenNobodyReads) {
   EXPECT_EQ(out_.str(), "");
 }
 
-TEST_F(ShowDriversTest, AWrongConfigurationIsTold) {
+TEST_F(ShowDriversTest, AWrongConfigurationIsReported) {
   std::ofstream(scratch_.path("halvox.toml")) << "[drivers]\nalsa = 1\n";
 
   EXPECT_EQ(showDrivers({}, OutputForm::kText, out_, -1, errors_), ExitStatus::kBadConfiguration);

@@ -112,7 +112,7 @@ TEST_F(EventsTest, JsonHasTimeNameAndPayload) {
   EXPECT_EQ(out.str().find('\x1B'), std::string::npos);
 }
 
-TEST_F(EventsTest, AStoreThatIsNotThereIsNoService) {
+TEST_F(EventsTest, AMissingStoreIsReportedAsNoService) {
   RecordSelection request;
   request.database = scratch_.path("elsewhere/halvox.db");
   std::ostringstream out;
@@ -154,7 +154,7 @@ TEST_F(EventsTest, TheConfigurationNamesTheStore) {
 }
 
 // Follows through a pipe, as another program would: its lines are read at this end.
-TEST_F(EventsTest, FollowingShowsWhatComesUntilNobodyReads) {
+TEST_F(EventsTest, FollowingShowsNewEventsUntilTheOutputIsClosed) {
   store("com.a.first", {{"n", 1}});
   const std::string pipePath = scratch_.path("pipe");
   ASSERT_EQ(mkfifo(pipePath.c_str(), 0600), 0);

@@ -70,7 +70,7 @@ class HalvoxctlTest : public testing::Test {
   client::TestService service_{scratch_.path("reporting.sock")};
 };
 
-TEST_F(HalvoxctlTest, DoneIsStatus0AndSaysNothing) {
+TEST_F(HalvoxctlTest, SuccessIsStatus0WithoutOutput) {
   const auto outcome = runProgram(with({"create", "7"}));
 
   EXPECT_EQ(outcome.status, 0);
@@ -137,7 +137,7 @@ TEST_F(HalvoxctlTest, RunsAScriptOverOneConnection) {
             "\"answer\":{\"reporterID\":7,\"serviceType\":65535}}\n");
 }
 
-TEST_F(HalvoxctlTest, TheShellGoesOnBehindMistakes) {
+TEST_F(HalvoxctlTest, TheShellContinuesAfterErrors) {
   const auto outcome = runProgram(with({"shell"}), "create x\ncreate 7\nlist\nquit\nlist\n");
 
   EXPECT_EQ(outcome.status, 2);

@@ -13,7 +13,7 @@ std::string errorOf(std::string_view json) {
   return error != nullptr ? error->message : "";
 }
 
-TEST(JsonErrorTest, SaysWhatWasExpectedAndWhatWasFoundWhere) {
+TEST(JsonErrorTest, ReportsWhatWasExpectedAndFoundAndWhere) {
   EXPECT_EQ(errorOf(R"({"a":})"), R"(line 1, column 6: expected a value, found "}")");
   EXPECT_EQ(errorOf("{\n \"a\": 1,\n}"),
             "line 3, column 1: expected a name in double quotes, found \"}\"");

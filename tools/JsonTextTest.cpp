@@ -63,7 +63,7 @@ TEST(JsonTextTest, RefusesAKeyThatOccursTwice) {
   EXPECT_EQ(errorOf(R"({"x": {"a": 1, "a": 2}})"), "\"x.a\": the key occurs twice");
 }
 
-TEST(JsonTextTest, SaysWhereTextIsNoJson) {
+TEST(JsonTextTest, ReportsWhereTextIsNotJson) {
   EXPECT_EQ(errorOf(R"({"a": 1,})").substr(0, 19), "line 1, column 9: e");
   EXPECT_NE(errorOf(""), "");
   EXPECT_NE(errorOf(R"({"a": 1} x)"), "");
@@ -116,7 +116,7 @@ TEST(JsonTextTest, JsonForATerminalStaysTheSameJson) {
   EXPECT_EQ(dictionaryOf(json), dictionaryOf("{\"a\":\"\xC2\x9B\x7F\"}"));
 }
 
-TEST(JsonTextTest, QuotedTextIsJsonWhateverItsBytes) {
+TEST(JsonTextTest, QuotedTextIsAlwaysJson) {
   EXPECT_EQ(quoted("a\"b\x01\xFF"), "\"a\\\"b\\u0001\xEF\xBF\xBD\"");
 }
 
@@ -130,7 +130,7 @@ TEST(JsonTextTest, FieldsCannotDriveATerminal) {
             R"(a\u001b="\u001B]0;x\u0007" b=\u009b)");
 }
 
-TEST(JsonTextTest, WhatIsNoObjectIsShownAsItIs) {
+TEST(JsonTextTest, TextThatIsNotAnObjectIsShownUnchanged) {
   EXPECT_EQ(fieldsOfJson("not \x1B json"), "not \\u001b json");
 }
 

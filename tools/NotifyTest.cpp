@@ -57,7 +57,7 @@ TEST_F(NotifyTest, NamesThatLeaveTheDirectoryAreBadArguments) {
   EXPECT_FALSE(std::filesystem::exists(directory_));
 }
 
-TEST_F(NotifyTest, NamesThatNobodyListensForArePostedToNobody) {
+TEST_F(NotifyTest, NamesThatTheServiceDoesNotWatchAreRefused) {
   EXPECT_EQ(post("bogus"), ExitStatus::kBadArguments);
 
   EXPECT_EQ(errors_.str(),
@@ -67,7 +67,7 @@ TEST_F(NotifyTest, NamesThatNobodyListensForArePostedToNobody) {
   EXPECT_FALSE(std::filesystem::exists(directory_));
 }
 
-TEST_F(NotifyTest, WhatIsNoFileIsToldAndBlocksNobody) {
+TEST_F(NotifyTest, ASpecialFileIsReportedWithoutBlocking) {
   ASSERT_EQ(post(kOther), ExitStatus::kDone);
   ASSERT_EQ(::mkfifo((directory_ + "/" + kName).c_str(), 0600), 0);
 

@@ -63,7 +63,7 @@ TEST(PreferenceEditingTest, AStringCanBeForced) {
   EXPECT_EQ(value("7", ValueForm::kString).text, "\"7\"");
 }
 
-TEST(PreferenceEditingTest, BytesThatAreNoTextAreRefused) {
+TEST(PreferenceEditingTest, BytesThatAreNotTextAreRefused) {
   EXPECT_FALSE(parsePreferenceValue("a\xff", ValueForm::kString));
 }
 
@@ -82,7 +82,7 @@ TEST(PreferenceEditingTest, AValueOfSeveralLinesIsReplacedAsAWhole) {
   EXPECT_EQ(set("a = '''x\ny''' # c\n", "a", "3"), "a = 3 # c\n");
 }
 
-TEST(PreferenceEditingTest, ANewKeyComesBehindTheOthersOfTheFirstLevel) {
+TEST(PreferenceEditingTest, ANewKeyFollowsTheOtherTopLevelKeys) {
   EXPECT_EQ(set("", "a", "1"), "a = 1\n");
   EXPECT_EQ(set("a = 1", "b", "x"), "a = 1\nb = \"x\"\n");
   EXPECT_EQ(set("# only a comment\n", "a", "1"), "# only a comment\na = 1\n");

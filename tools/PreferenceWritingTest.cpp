@@ -136,7 +136,7 @@ TEST_F(PreferenceWritingTest, ADirectoryThatCannotBeMadeIsNamed) {
   EXPECT_NE(changed.error().message.find(file_.parent_path().native()), std::string::npos);
 }
 
-TEST_F(PreferenceWritingTest, WhatIsNoRegularFileIsLeftAlone) {
+TEST_F(PreferenceWritingTest, SpecialFilesAreNotChanged) {
   std::filesystem::create_directories(file_.parent_path());
   ASSERT_EQ(::mkfifo(file_.c_str(), 0600), 0);
 

@@ -73,7 +73,7 @@ TEST_F(PreferencesTest, ADomainIsShownAsLinesOrAsOneObject) {
   EXPECT_EQ(out_.str(), "\"x\"\n");
 }
 
-TEST_F(PreferencesTest, WhatIsNotSetIsStatus1) {
+TEST_F(PreferencesTest, AMissingKeyIsStatus1) {
   write("a = 1\n");
 
   EXPECT_EQ(run({"get", "d", "b"}), ExitStatus::kRefused);
@@ -110,7 +110,7 @@ TEST_F(PreferencesTest, BadArgumentsAreStatus2) {
   EXPECT_FALSE(std::filesystem::exists(directory_));
 }
 
-TEST_F(PreferencesTest, ABrokenFileIsToldWithItsPlaceAndLeftAlone) {
+TEST_F(PreferencesTest, ABrokenFileIsReportedWithItsPlaceAndNotChanged) {
   write("a =\n");
 
   EXPECT_EQ(run({"get", "d"}), ExitStatus::kCannotWrite);

@@ -106,7 +106,7 @@ TEST_F(RecordsTest, OtherMetricsAreShownByTheirBytes) {
   EXPECT_THAT(shown(Kind::kMetrics, OutputForm::kJson), Not(HasSubstr("\"fields\"")));
 }
 
-TEST_F(RecordsTest, BytesThatAreNoIssueMetricAreShownAsTheyAre) {
+TEST_F(RecordsTest, BytesThatAreNotAnIssueMetricAreShownUnchanged) {
   store_->issueMetrics().add(
       {.time = 100, .metricID = kIssueMetric, .message = {std::byte{0x1A}, std::byte{0x05}}});
 
@@ -183,7 +183,7 @@ TEST_F(RecordsTest, NothingThatAClientSentDrivesTheTerminal) {
   }
 }
 
-TEST_F(RecordsTest, AStoreThatIsNotThereIsNamedByTheCommand) {
+TEST_F(RecordsTest, AMissingStoreIsReportedByTheCommand) {
   ShowRecords request{Kind::kPower, {}, {}, {}, {}};
   request.selection.database = scratch_.path("elsewhere");
   std::ostringstream out;

@@ -87,7 +87,7 @@ TEST_F(ScriptTest, NamesTheLineOfARefusal) {
   EXPECT_EQ(errors_.str(), "file:2: send: refused by the test (com.tarno.audio.reporting.Code1)\n");
 }
 
-TEST_F(ScriptTest, MayGoOnBehindFailuresAndStillReportsTheFirst) {
+TEST_F(ScriptTest, MayContinueAfterFailuresAndReturnsTheFirst) {
   EXPECT_EQ(run("create x\nvalid 8\ncreate 9\n", true), ExitStatus::kBadArguments);
 
   EXPECT_EQ(service_.members(), "reporterIDValid createReportingSession");
@@ -99,7 +99,7 @@ TEST_F(ScriptTest, ALostConnectionEndsItInAnyCase) {
   EXPECT_EQ(errors_.str(), "file:3: create: the service ended the connection\n");
 }
 
-TEST_F(ScriptTest, AStartThatStillRunsIsNoAnswerInTime) {
+TEST_F(ScriptTest, AStartThatStillRunsIsNotAnsweredInTime) {
   EXPECT_EQ(run("create 7\nstart 7 --wait 0.05\n"), ExitStatus::kRefused);
 
   EXPECT_NE(errors_.str().find("file:2: start: the start was not answered in time"),

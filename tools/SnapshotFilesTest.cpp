@@ -85,7 +85,7 @@ TEST_F(SnapshotFilesTest, WithoutSnapshotsThereIsNoNewest) {
   EXPECT_THAT(errors_.str(), HasSubstr("halvoxctl snapshots show: there is no snapshot in "));
 }
 
-TEST_F(SnapshotFilesTest, ADirectoryOfSnapshotsThatCannotBeReadIsToldWithTheReason) {
+TEST_F(SnapshotFilesTest, AnUnreadableDirectoryOfSnapshotsIsReportedWithTheReason) {
   fs::remove_all(directory_ / "state/snapshots");
   std::ofstream(directory_ / "state/snapshots") << "in the way";
 
@@ -93,7 +93,7 @@ TEST_F(SnapshotFilesTest, ADirectoryOfSnapshotsThatCannotBeReadIsToldWithTheReas
   EXPECT_THAT(errors_.str(), HasSubstr("state/snapshots: Not a directory"));
 }
 
-TEST_F(SnapshotFilesTest, WhatIsNoSnapshotIsNamed) {
+TEST_F(SnapshotFilesTest, FilesThatAreNotSnapshotsAreNamed) {
   EXPECT_EQ(show((directory_ / "none").native()), ExitStatus::kBadArguments);
   EXPECT_EQ(show((directory_ / "halvox.toml").native()), ExitStatus::kBadArguments);
   EXPECT_EQ(show(archive("20260301T120000Z", "x", "[1")), ExitStatus::kBadArguments);

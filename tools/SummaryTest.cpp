@@ -72,7 +72,7 @@ TEST_F(SummaryTest, NameIsTakenApartFromBothEnds) {
   EXPECT_EQ(name->service, "telephony");
 }
 
-TEST_F(SummaryTest, OtherNamesAreNone) {
+TEST_F(SummaryTest, OtherNamesAreNotParsed) {
   for (const char* name :
        {"", ".json", "20231114-204320-0130-halvox-a.json", "20231314-204320-0130-halvox-a-b.json",
         "20231114-204320-0130-halvox-a-b", "20231114-204320-0130-other-a-b.json",
@@ -129,7 +129,7 @@ TEST_F(SummaryTest, StoreWithoutSummariesIsAnError) {
   EXPECT_THAT(errors_.str(), HasSubstr("has no summaries"));
 }
 
-TEST_F(SummaryTest, BrokenFileIsToldAndTheOthersAreShown) {
+TEST_F(SummaryTest, BrokenFileIsReportedAndTheOthersAreShown) {
   const std::string broken = write("broken.json", "[{\"A\": {\"b\": 1}");
 
   EXPECT_EQ(show({write(kName, kText), broken}), ExitStatus::kBadArguments);
@@ -147,7 +147,7 @@ TEST_F(SummaryTest, MissingFilesAndDirectoriesAreErrors) {
   EXPECT_THAT(errors_.str(), HasSubstr("is not a file"));
 }
 
-TEST_F(SummaryTest, WhatIsNoSummaryIsSaid) {
+TEST_F(SummaryTest, FilesThatAreNotSummariesAreReported) {
   EXPECT_THAT(problemOf(""), HasSubstr("empty"));
   EXPECT_THAT(problemOf("{}"), HasSubstr("expected an array of messages"));
   EXPECT_THAT(problemOf("7"), HasSubstr("expected an array of messages"));

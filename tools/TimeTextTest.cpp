@@ -46,7 +46,7 @@ TEST_F(TimeTextTest, DatesWithoutOffsetAreLocal) {
   EXPECT_EQ(valueOf(parseTime("1970-01-02T02:00:00", kNow)), 86'400.0);
 }
 
-TEST_F(TimeTextTest, WhatIsNoTimeIsRefused) {
+TEST_F(TimeTextTest, WrongTimesAreRefused) {
   for (const char* wrong :
        {"", "5 m", "m", "min", "5y", "--5m", "@", "2026-11-21 22", "2026-11-21 22:4",
         "2026-11-21 24:00", "2026-02-30T00:00:00Z", "2026-13-01T00:00:00Z", "2026-1-1T00:00:00Z",
@@ -86,7 +86,7 @@ TEST_F(TimeTextTest, TimesThatCommandsPrintAreTaken) {
   EXPECT_EQ(valueOf(parseTime("19700102-010000+0100", kNow)), 86'400.0);
 }
 
-TEST_F(TimeTextTest, WhatIsNoTimeIsAnsweredWithExamples) {
+TEST_F(TimeTextTest, WrongTimesAreReportedWithExamples) {
   const auto error = std::get<ArgumentError>(parseTime("tea", kNow)).message;
 
   for (const char* part :

@@ -36,7 +36,7 @@ TEST_F(TraceResultsTest, NamesStandAsInTheFileWithTheirValues) {
   EXPECT_TRUE(results->values[1].second.empty());
 }
 
-TEST_F(TraceResultsTest, WhatIsNoResultsFileIsAnError) {
+TEST_F(TraceResultsTest, AFileThatHasNoResultsIsAnError) {
   for (const char* text : {"", "{", "[]", "{}", R"({"product": 1, "unit": "ns", "values": {}})",
                            R"({"product": "P", "unit": "s", "values": {}})",
                            R"({"product": "P", "unit": "ns", "values": {"a": 1}})"}) {
@@ -59,7 +59,7 @@ TEST_F(TraceResultsTest, StatisticsAreValuesThatWereMeasured) {
   EXPECT_EQ(statisticsOf({7}).percentile95, 7);
 }
 
-TEST_F(TraceResultsTest, IntervalsOfOneNameStandOneBehindTheOther) {
+TEST_F(TraceResultsTest, IntervalsOfOneNameFollowEachOther) {
   std::ostringstream out;
 
   writeTraceEvents({.product = "P", .values = {{"a", {1000, 2000}}, {"b", {500}}}}, out);

@@ -86,7 +86,7 @@ TEST_F(TraceIntervalTest, SameThreadDropsAnOpenStartAtTheEndWithoutAWord) {
   EXPECT_TRUE(platform_.log.lines().empty());
 }
 
-TEST_F(TraceIntervalTest, SameThreadLineAboutStopsTellsTheNumberOfStarts) {
+TEST_F(TraceIntervalTest, SameThreadLineAboutStopsShowsTheNumberOfStarts) {
   sameThread({event(kEnd, 1), event(kEnd, 2), event(kBegin, 3), event(kBegin, 4)});
 
   EXPECT_EQ(platform_.log.texts(LogLevel::kDebug), (Texts{starts(1), stops(1)}));
@@ -109,7 +109,7 @@ TEST_F(TraceIntervalTest, AnyThreadMeasuresFromTheNewerOfTwoStarts) {
   EXPECT_EQ(platform_.log.texts(LogLevel::kDefault), Texts{starts(1)});
 }
 
-TEST_F(TraceIntervalTest, AnyThreadTakesAStartAtTickZeroForNone) {
+TEST_F(TraceIntervalTest, AnyThreadTreatsAStartAtTickZeroAsNone) {
   EXPECT_TRUE(anyThread({event(kBegin, 0), event(kEnd, 5)}).empty());
   EXPECT_EQ(platform_.log.texts(LogLevel::kDefault), Texts{stops(0)});
 }
@@ -130,7 +130,7 @@ TEST_F(TraceIntervalTest, CodeThatIsBeginAndEndOnlyBegins) {
   EXPECT_EQ(platform_.log.texts(LogLevel::kDefault), Texts{starts(1)});
 }
 
-TEST_F(TraceIntervalTest, NoEventsDoNothingAndSayNothing) {
+TEST_F(TraceIntervalTest, NoEventsDoNothingAndLogNothing) {
   EXPECT_TRUE(sameThread({}).empty());
   EXPECT_TRUE(anyThread({}).empty());
   EXPECT_TRUE(platform_.log.lines().empty());

@@ -54,7 +54,7 @@ struct Recorder final : TraceParamsParser::Listener {
   Texts points;
 };
 
-TEST_F(TraceParamsParserTest, TellsAListenerWhatItWouldLogAndLogsNothing) {
+TEST_F(TraceParamsParserTest, ReportsToAListenerInsteadOfLogging) {
   platform_.propertyLists.setFile(
       kFile, Dictionary{{"Children", Array{trace("T", {interval("a", "1", "2"), Array{}})}}});
   Recorder recorder;
@@ -154,7 +154,7 @@ TEST_F(TraceParamsParserTest, UnknownTypeOfTheFirstPointIsAnImpulse) {
   EXPECT_EQ(loadPoints({unknown})[0].kind, TracePointKind::kImpulse);
 }
 
-TEST_F(TraceParamsParserTest, MatchesByThreadOnlyWhenToldExactlySo) {
+TEST_F(TraceParamsParserTest, MatchesByThreadOnlyForTheExactText) {
   Dictionary process = interval("a", "1", "2");
   process.set(platform::Key("EventsMatchedBy"), "Process");
   Dictionary lowerCase = process;
@@ -167,7 +167,7 @@ TEST_F(TraceParamsParserTest, MatchesByThreadOnlyWhenToldExactlySo) {
   }
 }
 
-TEST_F(TraceParamsParserTest, SaysWhichCodesItRead) {
+TEST_F(TraceParamsParserTest, LogsWhichCodesItRead) {
   loadPoints({interval("a", "0x2A", "FFFFFFFF")});
 
   EXPECT_EQ(platform_.log.texts(LogLevel::kInfo),
@@ -237,7 +237,7 @@ TEST_F(TraceParamsParserTest, NameOfAnotherKindIsItsText) {
   EXPECT_EQ(load({one}).name, "7");
 }
 
-TEST_F(TraceParamsParserTest, FileThatCannotBeReadIsLoggedThreeTimesAndSaysNothing) {
+TEST_F(TraceParamsParserTest, FileThatCannotBeReadIsLoggedThreeTimesAndGivesAnEmptyRecord) {
   const TraceParams params = TraceParamsParser("/none").loadTraceParams();
 
   EXPECT_EQ(params.name, "");
@@ -250,7 +250,7 @@ TEST_F(TraceParamsParserTest, FileThatCannotBeReadIsLoggedThreeTimesAndSaysNothi
                              "expected an array, found (null)"}));
 }
 
-TEST_F(TraceParamsParserTest, BrokenFileIsLoggedAndSaysNothing) {
+TEST_F(TraceParamsParserTest, BrokenFileIsLoggedAndGivesAnEmptyRecord) {
   platform_.propertyLists.setBrokenFile(kFile);
 
   EXPECT_TRUE(TraceParamsParser(kFile).loadTraceParams().tracePoints.empty());
@@ -258,7 +258,7 @@ TEST_F(TraceParamsParserTest, BrokenFileIsLoggedAndSaysNothing) {
   EXPECT_EQ(errors()[1], "No valid input found in plist.");
 }
 
-TEST_F(TraceParamsParserTest, RootThatIsNoDictionarySaysNothing) {
+TEST_F(TraceParamsParserTest, RootThatIsNotADictionaryGivesAnEmptyRecord) {
   platform_.propertyLists.setFile(kFile, Array{"Children"});
 
   const TraceParams params = TraceParamsParser(kFile).loadTraceParams();

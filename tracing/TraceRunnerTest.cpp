@@ -329,7 +329,7 @@ TEST_F(TraceRunnerTest, StopWaitsForTheStartAndIsLoggedAfterIt) {
   EXPECT_NE(std::find(failed, all.end(), "Tearing down trace :  Startup"), all.end());
 }
 
-TEST_F(TraceRunnerTest, RunnerThatGoesBeforeTheTracerHasStartedLeavesNoRecording) {
+TEST_F(TraceRunnerTest, RunnerDestroyedBeforeTheTracerHasStartedLeavesNoRecording) {
   auto runner = std::make_unique<TraceRunner>();
   const TraceParams one = params("Startup");
   runner->createTraceFromTraceParams(&one);
@@ -365,7 +365,7 @@ TEST_F(TraceRunnerTest, ResultsFileThatCannotBeOpenedEndsTheProcessWithStatusOne
   EXPECT_TRUE(errors().empty());
 }
 
-TEST_F(TraceRunnerTest, RunnerThatGoesUnstoppedDestroysItsRecordings) {
+TEST_F(TraceRunnerTest, RunnerDestroyedUnstoppedDestroysItsRecordings) {
   auto runner = std::make_unique<TraceRunner>();
   const TraceParams one = params("Startup");
   runner->createTraceFromTraceParams(&one);

@@ -34,7 +34,7 @@ TEST_F(RouteGraphTest, NamesADeviceOnceHoweverManyChannelsAreLinked) {
   EXPECT_EQ(names(), Names({"speakers"}));
 }
 
-TEST_F(RouteGraphTest, KeepsADeviceUntilItsLastLinkGoes) {
+TEST_F(RouteGraphTest, KeepsADeviceUntilItsLastLinkIsRemoved) {
   graph.addLink(1, {.output = kStream, .input = kSpeakers});
   graph.addLink(2, {.output = kStream, .input = kSpeakers});
 
@@ -59,7 +59,7 @@ TEST_F(RouteGraphTest, FollowsTheDirectionOfTheStream) {
   EXPECT_EQ(names(Direction::kPlayback), Names());
 }
 
-TEST_F(RouteGraphTest, LeavesPeersOutThatAreNoDevices) {
+TEST_F(RouteGraphTest, IgnoresPeersThatAreNotDevices) {
   graph.addLink(1, {.output = kStream, .input = 99});
 
   EXPECT_EQ(names(), Names());

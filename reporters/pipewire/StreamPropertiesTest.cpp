@@ -63,7 +63,7 @@ TEST(MakeConfigurationTest, TakesStreamPropertiesOver) {
   EXPECT_EQ(configuration, expected);
 }
 
-TEST(MakeConfigurationTest, CleansTextsAndDropsNumbersThatAreNone) {
+TEST(MakeConfigurationTest, CleansTextsAndOmitsWrongNumbers) {
   const auto configuration = makeConfiguration({{"media.name", "\xFFsong"},
                                                 {"application.process.id", "-3"},
                                                 {"object.serial", "1e9"},

@@ -31,7 +31,7 @@ TEST_F(StreamTrackerTest, GivesAStreamASessionWhenItAppears) {
   EXPECT_EQ(client.last("configure").find(kApplicationKey)->string(), "Player");
 }
 
-TEST_F(StreamTrackerTest, LeavesNodesAloneThatAreNoAudioStreams) {
+TEST_F(StreamTrackerTest, IgnoresNodesThatAreNotAudioStreams) {
   for (const char* mediaClass : {"Audio/Source", "Stream/Output/Video", "Stream/Input/Midi", "",
                                  "stream/output/audio", "Stream/Output/Audio/Internal"}) {
     tracker.nodeAdded({.id = 30, .serial = 30, .mediaClass = mediaClass, .properties = {}});
@@ -42,7 +42,7 @@ TEST_F(StreamTrackerTest, LeavesNodesAloneThatAreNoAudioStreams) {
   EXPECT_THAT(client.operations(), IsEmpty());
 }
 
-TEST_F(StreamTrackerTest, StartsTheSessionWhenTheStreamFirstRunsAndTellsWhatIsKnown) {
+TEST_F(StreamTrackerTest, StartsTheSessionWhenTheStreamFirstRunsAndSendsWhatIsKnown) {
   addStream();
   tracker.streamFormatChanged(kStream, {.encoding = "F32LE", .rate = 48000, .channels = 2});
   tracker.linkAdded(1, {.output = kStream, .input = kSpeakers});
@@ -59,7 +59,7 @@ TEST_F(StreamTrackerTest, StartsTheSessionWhenTheStreamFirstRunsAndTellsWhatIsKn
             platform::Value(platform::Array{"speakers"}));
 }
 
-TEST_F(StreamTrackerTest, StaysSilentBeforeTheFirstRun) {
+TEST_F(StreamTrackerTest, SendsNothingBeforeTheFirstRun) {
   addStream();
   client.forget();
 
@@ -94,7 +94,7 @@ TEST_F(StreamTrackerTest, SendsStopWhenIdleAndStartWhenRunningAgainInOneSession)
   EXPECT_TRUE(sentPlaying());
 }
 
-TEST_F(StreamTrackerTest, TellsVolumePlayingStateAndProcess) {
+TEST_F(StreamTrackerTest, SendsVolumePlayingStateAndProcess) {
   addStream();
   setVolume(0.25F);
 
@@ -106,7 +106,7 @@ TEST_F(StreamTrackerTest, TellsVolumePlayingStateAndProcess) {
                                                          {kSerialKey, kSerial}}));
 }
 
-TEST_F(StreamTrackerTest, TellsVolumeWhenItChanges) {
+TEST_F(StreamTrackerTest, SendsVolumeWhenItChanges) {
   runStream();
 
   setVolume(0.75F);
@@ -116,7 +116,7 @@ TEST_F(StreamTrackerTest, TellsVolumeWhenItChanges) {
   EXPECT_TRUE(sentPlaying());
 }
 
-TEST_F(StreamTrackerTest, TellsVolumeChangeOfAnIdleStreamAsNotPlaying) {
+TEST_F(StreamTrackerTest, SendsVolumeChangeOfAnIdleStreamAsNotPlaying) {
   runStream();
   tracker.streamRunningChanged(kStream, false);
 
@@ -126,7 +126,7 @@ TEST_F(StreamTrackerTest, TellsVolumeChangeOfAnIdleStreamAsNotPlaying) {
   EXPECT_FALSE(sentPlaying());
 }
 
-TEST_F(StreamTrackerTest, TellsMuteAsVolumeZeroWhileStillPlaying) {
+TEST_F(StreamTrackerTest, SendsMuteAsVolumeZeroWhileStillPlaying) {
   runStream();
 
   tracker.streamVolumeChanged(kStream, {.volume = {}, .channels = {}, .muted = true});
@@ -164,7 +164,7 @@ TEST_F(StreamTrackerTest, SendsNothingForNotificationsWithoutAChange) {
   EXPECT_THAT(client.operations(), IsEmpty());
 }
 
-TEST_F(StreamTrackerTest, TellsAChangedFormat) {
+TEST_F(StreamTrackerTest, SendsAChangedFormat) {
   runStream();
 
   tracker.streamFormatChanged(kStream, {.encoding = "S16LE", .rate = 44100, .channels = 1});
@@ -173,7 +173,7 @@ TEST_F(StreamTrackerTest, TellsAChangedFormat) {
   EXPECT_EQ(client.last("format").find(kFormatKey)->string(), "S16LE 44100 Hz 1 ch");
 }
 
-TEST_F(StreamTrackerTest, TellsTheNewRouteOfAMovedStreamOnce) {
+TEST_F(StreamTrackerTest, SendsTheNewRouteOfAMovedStreamOnce) {
   runStream();
   tracker.linkAdded(1, {.output = kStream, .input = kSpeakers});
   client.forget();
@@ -214,7 +214,7 @@ TEST_F(StreamTrackerTest, NamesADeviceWithoutDescriptionByItsNodeOrSerial) {
   EXPECT_EQ(client.last("route").find(kDevicesKey)->string(), "node-11");
 }
 
-TEST_F(StreamTrackerTest, EndsRunAndSessionOfARunningStreamThatGoes) {
+TEST_F(StreamTrackerTest, EndsRunAndSessionOfARunningStreamThatIsRemoved) {
   runStream();
 
   tracker.nodeRemoved(kStream);
@@ -256,7 +256,7 @@ TEST_F(StreamTrackerTest, ChangesTheServiceTypeWithTheRole) {
   EXPECT_EQ(client.calls()[0].serviceType, 2);
 }
 
-TEST_F(StreamTrackerTest, EndsAllSessionsWhenTheServerGoes) {
+TEST_F(StreamTrackerTest, EndsAllSessionsWhenTheServerDisconnects) {
   runStream();
   tracker.nodeAdded({.id = 21, .serial = 56, .mediaClass = "Stream/Input/Audio", .properties = {}});
   client.forget();
@@ -304,7 +304,7 @@ TEST_F(StreamTrackerTest, EndsAllSessionsOnDestruction) {
   EXPECT_THAT(client.operations(), ElementsAre("playback-stop", "stop", "destroy"));
 }
 
-TEST_F(StreamTrackerTest, TellsAServiceThatLostItsHistoryHowThingsAre) {
+TEST_F(StreamTrackerTest, SendsTheCurrentStateToARestartedService) {
   runStream();
   tracker.streamFormatChanged(kStream, {.encoding = "F32LE"});
   tracker.linkAdded(1, {.output = kStream, .input = kSpeakers});
@@ -316,7 +316,7 @@ TEST_F(StreamTrackerTest, TellsAServiceThatLostItsHistoryHowThingsAre) {
   EXPECT_TRUE(sentPlaying());
 }
 
-TEST_F(StreamTrackerTest, SaysNothingOfUnstartedSessionsAfterARestartOfTheService) {
+TEST_F(StreamTrackerTest, SendsNothingForUnstartedSessionsAfterARestartOfTheService) {
   addStream();
   setVolume(0.5F);
   client.forget();

@@ -40,7 +40,7 @@ TEST_F(StreamTrackerXrunTest, AMissedCycleIsReportedWithItsNodeApplicationAndLen
                                                                  {kSerialKey, kSerial}}));
 }
 
-TEST_F(StreamTrackerXrunTest, CyclesThatOtherNodesMissedAreNoIssueOfAStream) {
+TEST_F(StreamTrackerXrunTest, CyclesThatOtherNodesMissedAreNotReported) {
   cycle(Milliseconds(1000), {kSpeakers, 999});
   cycle(Milliseconds(2000), {});
 

@@ -59,7 +59,7 @@ TEST(DescribeFormatTest, NamesEncodingRateAndChannels) {
   EXPECT_EQ(describeFormat({.encoding = "mp3"}), "mp3");
 }
 
-TEST(StreamVolumeTest, IsUnknownUntilTold) {
+TEST(StreamVolumeTest, IsUnknownUntilTheFirstChange) {
   StreamVolume volume;
   EXPECT_FALSE(volume.effective());
 
@@ -87,7 +87,7 @@ TEST(StreamVolumeTest, IsZeroWhileMutedAndReturnsAfterwards) {
   EXPECT_EQ(volume.effective(), 0.3);
 }
 
-TEST(StreamVolumeTest, IgnoresNumbersThatAreNoVolume) {
+TEST(StreamVolumeTest, IgnoresNumbersThatAreNotVolumes) {
   StreamVolume volume;
   volume.apply({.volume = 0.5F, .channels = {{1.0F}}, .muted = false});
 
@@ -100,7 +100,7 @@ TEST(StreamVolumeTest, IgnoresNumbersThatAreNoVolume) {
   EXPECT_EQ(volume.effective(), 0.5);
 }
 
-TEST(StreamVolumeTest, TellsAmplificationUpToAHundred) {
+TEST(StreamVolumeTest, AmplifiesUpToAHundred) {
   StreamVolume volume;
   volume.apply({.volume = 1.5F, .channels = {}, .muted = {}});
   EXPECT_EQ(volume.effective(), 1.5);

@@ -125,7 +125,7 @@ TEST_F(StreamWatcherTest, ReportsTheSerialOfTheStreamInItsIdentifier) {
   EXPECT_EQ(static_cast<std::uint64_t>(client.calls().front().id) & 0xFFFFFFFFU, serial);
 }
 
-TEST_F(StreamWatcherTest, EndsSessionsWhenPipeWireGoesAndFollowsItAgainWhenItReturns) {
+TEST_F(StreamWatcherTest, EndsSessionsWhenPipeWireEndsAndFollowsItAfterItsRestart) {
   {
     const PipedProcess player = play(20);
     ASSERT_TRUE(waitFor("playback-start"));
@@ -179,7 +179,7 @@ TEST_F(StreamWatcherTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
   EXPECT_LE(std::ranges::count(client.operations(), "playback-issue") - reportsBefore, 4);
 }
 
-TEST_F(StreamWatcherTest, SleepsWhileThereIsNoStreamThoughThereIsAProfiler) {
+TEST_F(StreamWatcherTest, SleepsWithoutStreamsEvenWithAProfiler) {
   {
     const PipedProcess player = play(20);
     ASSERT_TRUE(waitFor("volume"));
@@ -207,7 +207,7 @@ TEST_F(StreamWatcherTest, SleepsWhileNothingChangesWithoutXruns) {
   EXPECT_EQ(woken, 0);
 }
 
-TEST_F(StreamWatcherTest, WaitsForAPipeWireThatIsNotThere) {
+TEST_F(StreamWatcherTest, WaitsForAMissingPipeWire) {
   watcher.reset();
   log.clear();
 

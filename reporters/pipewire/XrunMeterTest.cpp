@@ -55,7 +55,7 @@ TEST(XrunMeterTest, TheRestIsTakenWithoutWaiting) {
   EXPECT_EQ(meter.takeRest(), std::nullopt);
 }
 
-TEST(XrunMeterTest, ACycleThatIsToldTwiceCountsOnce) {
+TEST(XrunMeterTest, ACycleThatIsReportedTwiceCountsOnce) {
   XrunMeter meter;
   meter.add(5s, Seconds(0.25));
   meter.add(5s, Seconds(0.25));

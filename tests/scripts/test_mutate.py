@@ -124,7 +124,7 @@ class MutantsTest(unittest.TestCase):
                               ("text", "'x'", "'~'"), ("log level", "info", "error"),
                               ("log level", "kError", "kInfo"), ("boolean", "true", "false")}, found)
 
-    def test_what_belongs_to_types_is_no_operator(self):
+    def test_what_belongs_to_types_is_not_an_operator(self):
         self.assertEqual(edits("std::vector<int> a; T&& b = c; const auto* d = e;"), set())
         self.assertEqual(flat(mutants_of("a.h", "bool operator==(const A&) const;")), [])
 
@@ -137,7 +137,7 @@ class MutantsTest(unittest.TestCase):
             ("dropped statement", "d();", ""), ("dropped statement", "e();", ""),
             ("swapped statements", f"b(); {both}", f"{both} b();")})
 
-    def test_a_list_in_braces_is_no_block(self):
+    def test_a_list_in_braces_is_not_a_block(self):
         self.assertEqual(edits("const Name names{a, b};"), set())
 
 
@@ -215,7 +215,7 @@ class PlantedTest(unittest.TestCase):
         self.assertEqual(self.outcome("session/Planted.cpp", 17, "++sum;", ""),
                          ("killed", "timed out halvox_session_test"))
 
-    def test_an_edit_that_is_no_program_does_not_count(self):
+    def test_an_edit_that_does_not_compile_does_not_count(self):
         broken = mutants_of("session/Planted.cpp", SOURCE)[0][0]
         broken = type(broken)(broken.file, broken.line, "text", broken.start, broken.end,
                               broken.original, "no number")

@@ -81,7 +81,7 @@ class EndingTheService(AccessTest):
         self.assertEqual(stranger.reporters(), [7])
         self.assertIsNone(service.process.poll())
 
-    def test_the_command_says_why_and_the_service_goes_on(self):
+    def test_the_command_says_why_and_the_service_continues(self):
         service = self.system_service().start()
         kill = [*setpriv_to(NOBODY), self.copy(CTL), "--socket", str(service.socket), "kill"]
 
@@ -184,7 +184,7 @@ class WhoMayConnect(AccessTest):
                              "Operation not permitted")
         self.assertFalse(service.socket.exists())
 
-    def test_a_mode_that_is_none_is_refused_with_its_place(self):
+    def test_a_wrong_mode_is_refused_with_its_place(self):
         for text in ('"rw"', '"0888"', "660", '"0066"', '"1777"', '""'):
             with self.subTest(text=text):
                 service = self.system_service(listener=f"mode = {text}\n")

@@ -73,7 +73,7 @@ class DriversCommandTest(unittest.TestCase):
         self.assertEqual([channel["group"] for channel in self.show("--group", "Rx")], ["Rx"])
         self.assertEqual(len(self.show()), 2)
 
-    def test_watching_shows_the_change_per_second_until_nobody_reads(self):
+    def test_watching_shows_the_change_per_second_until_the_output_is_closed(self):
         write(self.directory, pulses(1000))
         command = self.watch("0.05")
         # After the first line, every change is in some line.

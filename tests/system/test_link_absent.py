@@ -97,10 +97,10 @@ class AbsentLinkTest(unittest.TestCase):
     def test_without_a_back_end_messages_are_dropped_by_the_link_alone(self):
         self.assert_session_fails(link("none"))
 
-    def test_no_server_at_the_address_is_told_and_clients_notice_nothing(self):
+    def test_no_server_at_the_address_is_logged_and_clients_notice_nothing(self):
         self.assert_session_fails(link("nats", f"nats://127.0.0.1:{free_ports(1)[0]}"))
 
-    def test_a_server_that_says_nothing_holds_back_the_link_alone(self):
+    def test_a_silent_server_delays_only_the_link(self):
         with SilentServer() as silent:
             self.assert_session_fails(link("nats", silent.url))
 

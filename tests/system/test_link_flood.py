@@ -103,7 +103,7 @@ class LinkFlood(unittest.TestCase):
     def test_flood_to_a_session_of_another_client_is_charged_to_the_sender(self):
         self.flood_past_the_limit(reporters=[7])
 
-    def test_what_was_answered_arrives_after_its_client_has_gone(self):
+    def test_what_was_answered_arrives_after_its_client_has_disconnected(self):
         service = self.service_with()
         client = service.client()
         self.assertEqual(self.answered(self.flood(client, "gone", OTHERS)), list(range(OTHERS)))

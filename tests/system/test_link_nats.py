@@ -122,7 +122,7 @@ class DeliveryTest(NatsTest):
 
             self.assertEqual(subject, "halvox.a_b__" + "x" * (128 - 5) + ".4")
 
-    def test_what_was_taken_goes_out_before_the_end(self):
+    def test_accepted_messages_are_sent_before_the_end(self):
         with Server() as server, Driver(server.url) as driver:
             driver.start(9)
             driver.found(9)
@@ -148,7 +148,7 @@ class DeliveryTest(NatsTest):
 
 
 class FailureTest(NatsTest):
-    def test_no_server_at_the_address_is_told_soon_and_tried_again(self):
+    def test_no_server_at_the_address_is_reported_soon_and_tried_again(self):
         port = free_ports(1)[0]
         with Driver(f"nats://127.0.0.1:{port}") as driver:
             driver.start(1)
@@ -218,7 +218,7 @@ class FailureTest(NatsTest):
             self.assertEqual(driver.flushed(f"{SUBJECT}.1"), [(10, 0), (100, 0)])
             self.assertEqual(balance(counters), 0)
 
-    def test_a_stream_that_is_gone_when_its_server_comes_back_is_made_again(self):
+    def test_a_stream_that_is_missing_when_its_server_returns_is_created_again(self):
         with Server() as server, Driver(server.url) as driver:
             driver.start(1)
             driver.found(1)
@@ -342,7 +342,7 @@ class EndTest(NatsTest):
 
             self.assert_ends_promptly(driver)
 
-    def test_a_silent_server_in_the_place_of_one_that_is_gone(self):
+    def test_a_silent_server_in_the_place_of_one_that_has_ended(self):
         port = free_ports(1)[0]
         with Server() as server, Driver(server.url, f"nats://127.0.0.1:{port}") as driver:
             driver.start(1)
@@ -550,7 +550,7 @@ class SecurityTest(NatsTest):
                 driver.end()
                 self.assertEqual(driver.flushed(f"{SUBJECT}.1"), [(10, 0)])
 
-    def test_tls_with_another_authority_is_no_server(self):
+    def test_tls_with_another_authority_finds_no_server(self):
         certificate, key = self.certificate()
         other, _ = self.certificate()
         tls = f'tls {{ cert_file: "{certificate}", key_file: "{key}" }}'
@@ -591,7 +591,7 @@ class SecurityTest(NatsTest):
         with Server(operator.config) as server:
             self.assert_reached(True, server.url, f'credentials = "{credentials}"')
 
-    def test_a_credentials_file_of_another_operator_is_no_server(self):
+    def test_a_credentials_file_of_another_operator_finds_no_server(self):
         operator, other = Operator(self.directory()), Operator(self.directory())
         credentials = other.credentials("reporter")
         with Server(operator.config) as server:
@@ -613,7 +613,7 @@ class SecurityTest(NatsTest):
                 self.assertTrue(driver.found(1)[0])
                 driver.end()
 
-    def test_a_credentials_file_that_is_missing_is_no_server(self):
+    def test_a_credentials_file_that_is_missing_finds_no_server(self):
         with Server() as server, Driver(server.url, extra='credentials = "/nowhere/user.creds"') as driver:
             driver.start(1)
             self.assertFalse(driver.found(1)[0])

@@ -133,7 +133,7 @@ class LinkSessions(LinkTest):
         self.wait_for((SINGLE, 20))
         self.assertEqual(self.heard(), {(SINGLE, 20)})
 
-    def test_a_restarted_session_begins_anew(self):
+    def test_a_restarted_session_forgets_its_history(self):
         started = self.start(self.reporting, 7)
         for text in ("first", "first", "same"):
             self.reporting.send({"a": text}, reporters=[7])

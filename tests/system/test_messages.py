@@ -83,13 +83,13 @@ class UptimeEventTest(MessagesTest):
         self.assertGreaterEqual(events[0]["seconds"], closing - registered - 0.05)
         self.assertLessEqual(events[0]["seconds"], after - before + 0.05)
 
-    def test_a_client_that_leaves_is_told_of_with_its_name_and_its_seconds(self):
+    def test_a_client_that_disconnects_is_reported_with_its_name_and_uptime(self):
         self.check_uptime("")
 
-    def test_the_uptime_is_told_though_no_event_is_wanted(self):
+    def test_the_uptime_is_recorded_even_if_no_event_is_wanted(self):
         self.check_uptime("[analytics]\nwanted = []\n")
 
-    def test_each_client_is_told_of_when_it_leaves_and_no_sooner(self):
+    def test_each_client_is_reported_when_it_disconnects_and_not_before(self):
         with Service() as service:
             first, second = service.client(), service.client()
             second.reporters()

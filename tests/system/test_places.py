@@ -127,7 +127,7 @@ class ServicePlacesTest(Places):
 
         self.assertEqual((result.stdout, result.stderr), ("7\n", ""))
 
-    def test_the_services_of_user_and_system_are_told_apart(self):
+    def test_the_services_of_user_and_system_are_distinguished(self):
         system = self.serve_system()
         user = self.serve_user()
         self.ctl("send", "--all", "--category", "1", "--type", "1", '{"where": "user"}')
@@ -139,7 +139,7 @@ class ServicePlacesTest(Places):
         system.wait_for_payload(lambda payload: payload.get("where") == "system")
         self.assertEqual({payload["where"] for _, payload in system.events()}, {"system"})
 
-    def test_a_socket_that_nobody_serves_is_passed_over_and_named(self):
+    def test_a_socket_without_a_service_is_skipped_and_named(self):
         self.serve_system()
         self.leave_stale_socket()
 
@@ -191,7 +191,7 @@ class ServicePlacesTest(Places):
         self.assertEqual(application.stdout.readline(), "0\n")
         self.assertEqual(application.stdout.readline(), f"{SYSTEM_SOCKET}\n")
 
-    def test_a_client_waits_for_its_own_service_before_it_goes_to_another(self):
+    def test_a_client_waits_for_its_own_service_before_it_uses_another(self):
         system = self.serve_system()
         user = self.serve_user()
         self.assertEqual(self.run_application().stdout.readline(), "0\n")

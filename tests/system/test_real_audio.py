@@ -73,7 +73,7 @@ class RealAudioTest(unittest.TestCase):
         names = [name for name, _ in self.service.events()]
         self.assertIn("com.tarno.telephony.Session_Record.Start", names)
 
-    def test_a_stream_goes_on_being_reported_after_the_service_was_killed(self):
+    def test_a_stream_is_still_reported_after_the_service_was_killed(self):
         player = self.play(30, volume=0.5)
         self.wait_for_message("Volume.State")
         self.service.stop(signal.SIGKILL)
@@ -96,7 +96,7 @@ class RealAudioTest(unittest.TestCase):
         self.wait_for_message("Session_Playback.Start", 2)
         self.assertEqual(len(self.reporters()), 1)
 
-    def test_a_reporter_that_is_told_to_end_stops_and_destroys_its_sessions(self):
+    def test_a_terminated_reporter_stops_and_destroys_its_sessions(self):
         for number in (signal.SIGTERM, signal.SIGINT):
             with self.subTest(signal=number):
                 self.assert_ends_its_sessions_on(number)

@@ -134,7 +134,7 @@ class Settings(unittest.TestCase):
 
         self.assertLess(min(delays), SOON, delays)
 
-    def test_a_started_session_hears_the_preference_that_is_set(self):
+    def test_a_started_session_receives_the_preference_that_is_set(self):
         self.set_device_name("Kitchen")
         client = self.client()
         client.create(101)

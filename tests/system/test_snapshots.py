@@ -108,7 +108,7 @@ class Snapshots(unittest.TestCase):
         signature = self.content(snapshots(service)[0], "signature.json")
         self.assertEqual(signature["DetectedProcess"], "renamed player")
 
-    def test_archive_tells_the_state_of_the_service_and_of_the_process(self):
+    def test_archive_holds_the_state_of_the_service_and_of_the_process(self):
         require("tar", "zstd")
         service = self.service(INTERNAL)
 
@@ -129,7 +129,7 @@ class Snapshots(unittest.TestCase):
             self.assertTrue(item["collected"] or item["reason"], item)
         self.assertLess(manifest["seconds"], WITHIN)
 
-    def test_reply_in_the_log_tells_the_file_its_size_and_the_time(self):
+    def test_reply_in_the_log_names_the_file_its_size_and_the_time(self):
         service = self.service(INTERNAL)
 
         _, archive = self.take_one(service)
@@ -218,7 +218,7 @@ class Snapshots(unittest.TestCase):
         self.assertEqual(service.stop(), 0)
         self.assertEqual(len(snapshots(service)), min(counted["delivered"], 20))
 
-    def test_only_so_many_are_kept_as_the_configuration_says(self):
+    def test_at_most_the_configured_number_is_kept(self):
         service = self.service(INTERNAL + "[diagnostics]\nkeep_snapshots = 2\n")
         haptics, first = self.take_one(service)
         for number in range(3):
@@ -231,7 +231,7 @@ class Snapshots(unittest.TestCase):
         self.assertEqual(len(snapshots(service)), 2)
         self.assertNotIn(first, snapshots(service))
 
-    def test_directory_in_the_way_is_an_error_line_and_works_again_when_it_is_gone(self):
+    def test_directory_in_the_way_is_an_error_line_until_it_is_removed(self):
         service = self.service(INTERNAL)
         place = service.directory / "state" / "snapshots"
         place.write_text("in the way")

@@ -115,7 +115,7 @@ class Startup(unittest.TestCase):
             self.assertEqual(client.reporters(), [])
             client.close()
 
-    def test_socket_that_nobody_serves_is_replaced(self):
+    def test_socket_without_a_service_is_replaced(self):
         service = Service(directory=self.directory).start()
         service.stop(signal.SIGKILL)
         self.assertTrue(service.socket.exists())
@@ -188,7 +188,7 @@ class Startup(unittest.TestCase):
 
 
 class SocketDirectoryAppears(unittest.TestCase):
-    def test_report_signal_logs_all_counters_and_the_service_goes_on(self):
+    def test_report_signal_logs_all_counters_and_the_service_continues(self):
         with Service() as service:
             service.process.send_signal(signal.SIGUSR1)
             wait_for("the counters", lambda: "counted files, files written: 0" in service.log())

@@ -235,14 +235,14 @@ class NamesTest(WithService):
 
 
 class NothingDoneTest(WithService):
-    def test_a_notification_that_nobody_hears_is_refused_with_those_that_there_are(self):
+    def test_an_unknown_notification_is_refused_with_the_known_ones(self):
         error = self.ctl("notify", "bogus", status=2).stderr
         self.assertIn("nothing was posted", error)
         names = re.findall(r"com\.tarno\.[\w.-]+\w", error)
         self.assertEqual(len(names), 2)
         self.assertFalse((self.service.directory / "state/notify/bogus").exists())
 
-    def test_the_service_hears_every_notification_that_is_offered(self):
+    def test_the_service_receives_every_notification_that_is_offered(self):
         self.service.stop()
         self.service.config.write_text(self.service.config.read_text() + '[log]\nlevel = "debug"\n')
         self.service.start()
@@ -253,7 +253,7 @@ class NothingDoneTest(WithService):
             wait_for(f"{name} to be heard",
                      lambda: self.service.log().count("defaults (null)") > heard)
 
-    def test_a_group_that_is_not_there_is_refused_with_those_that_there_are(self):
+    def test_an_unknown_group_is_refused_with_the_existing_ones(self):
         drivers = self.service.directory / "state/drivers"
         drivers.mkdir()
         (drivers / "a.prom").write_text('# TYPE a counter\na_total{group="Rx"} 3\n')
@@ -271,7 +271,7 @@ class WordsTest(WithService):
             self.assertIn(" latency=0.042666666666666665 gain=1 ", text)
             self.assertNotIn("0.042666666666666668", text)
 
-    def test_mistakes_in_json_are_told_with_their_place(self):
+    def test_mistakes_in_json_are_reported_with_their_place(self):
         self.assertEqual(
             self.ctl("configure", "7", '{"a":}', status=2).stderr.splitlines()[0],
             'halvoxctl configure: JSON: line 1, column 6: expected a value, found "}"')

@@ -138,7 +138,7 @@ class TraceMarksTest(unittest.TestCase):
             self.assertEqual(service.marks(),
                              [CREATE, CREATED, START, STARTED, STOPPED, DESTROYED])
 
-    def test_a_single_message_leaves_its_mark_when_it_goes_out(self):
+    def test_a_single_message_leaves_its_mark_when_it_is_sent(self):
         with recorded_service(self.LOG) as service:
             client = service.client()
             client.create(7)

@@ -91,7 +91,7 @@ class KernelTraceTest(unittest.TestCase):
             self.assertFalse(is_running(daemon))
             self.assertFalse(service.note.exists())
 
-    def test_events_that_find_no_room_are_counted_and_told(self):
+    def test_events_that_find_no_room_are_counted_and_reported(self):
         events = 600_000  # the buffers of a processor have room for about a third of them
         processor = min(os.sched_getaffinity(0))
         with TracedService() as service:
@@ -291,7 +291,7 @@ class ForgottenTraceTest(unittest.TestCase):
             client.stop(REPORTER)
             self.assert_nothing_records_once_released(service, client)
 
-    def test_performance_trace_of_a_session_that_is_no_test_any_more(self):
+    def test_performance_trace_of_a_session_that_is_no_longer_a_test(self):
         with TracedService() as service:
             client = start_session(service, trace_type=None)
             wait_for("its start", lambda: "Performance Trace Started" in service.log())
@@ -299,7 +299,7 @@ class ForgottenTraceTest(unittest.TestCase):
             client.stop(REPORTER)
             self.assert_nothing_records_once_released(service, client)
 
-    def test_kernel_trace_of_a_session_that_is_no_test_any_more(self):
+    def test_kernel_trace_of_a_session_that_is_no_longer_a_test(self):
         with TracedService() as service:
             client = start_session(service)
             client.set_type(5, REPORTER)
@@ -338,7 +338,7 @@ class ToolTest(unittest.TestCase):
             self.assertEqual(sum(event["name"] == "Shared" and event["ph"] == "X"
                                  for event in events), THREADS * 5)
 
-    def test_program_that_fails_is_told(self):
+    def test_program_that_fails_is_reported(self):
         with TracedService() as service:
             done = self.record(service, "false")
 
@@ -362,7 +362,7 @@ class ToolTest(unittest.TestCase):
             self.assertIn(reason, done.stderr)
         self.assertFalse(mark.exists())
 
-    def test_parameters_file_that_is_no_property_list_is_told(self):
+    def test_parameters_file_that_is_not_a_property_list_is_reported(self):
         with TracedService() as service:
             for text in ("", "hello", "<plist><dict><key>Children</key>"):
                 with self.subTest(text):
@@ -370,14 +370,14 @@ class ToolTest(unittest.TestCase):
                     self.assert_refused(service, "Reading from plist file failed with error: ",
                                         "the property list ")
 
-    def test_parameters_file_that_cannot_be_read_is_told(self):
+    def test_parameters_file_that_cannot_be_read_is_reported(self):
         with TracedService() as service:
             service.params.unlink()
             self.assert_refused(service, "No such file or directory")
             service.params.mkdir()
             self.assert_refused(service, "Is a directory")
 
-    def test_parameters_file_without_an_interval_is_told_with_what_is_wrong_in_it(self):
+    def test_parameters_file_without_an_interval_is_reported_with_its_faults(self):
         with TracedService() as service:
             service.params.write_bytes(plistlib.dumps({"Kinder": []}))
             self.assert_refused(service, "Failed to load Trace Parameter Array with error: "
@@ -392,13 +392,13 @@ class ToolTest(unittest.TestCase):
             service.write_params(POINTS, trace_type="OSSignpost")
             self.assert_refused(service, "OSSignpost")
 
-    def test_parameters_file_whose_codes_are_never_recorded_is_told(self):
+    def test_parameters_file_whose_codes_are_never_recorded_is_reported(self):
         with TracedService() as service:
             service.write_params([interval("IOStart", 0x1A2B0001, 0x1A2B0002)])
 
             self.assert_refused(service, "IOStart", "0x1a2b0001", "0x21040000")
 
-    def test_parameters_file_that_is_partly_wrong_is_told_beside_the_results(self):
+    def test_parameters_file_that_is_partly_wrong_is_reported_beside_the_results(self):
         with TracedService() as service:
             service.write_params([POINTS[0], {**POINTS[1], "Type": "Intervall"}])
             done = self.record(service, program("halvox_trace_client"), "intervals", 1)
@@ -407,7 +407,7 @@ class ToolTest(unittest.TestCase):
             self.assertIn('"Shared"', done.stdout)
             self.assertIn("TracePointType field not recognized or is empty.", done.stderr)
 
-    def test_program_that_emits_nothing_is_told(self):
+    def test_program_that_emits_nothing_is_reported(self):
         with TracedService() as service:
             done = self.record(service, "true")
 
@@ -415,7 +415,7 @@ class ToolTest(unittest.TestCase):
             self.assert_only_failures(done.stdout)
             self.assertIn("nothing was measured", done.stderr)
 
-    def test_service_that_does_not_trace_is_told(self):
+    def test_service_that_does_not_trace_is_reported(self):
         with TracedService(switch="false") as service:
             done = self.record(service, "true")
 

@@ -36,7 +36,7 @@ class NoTracerTest(unittest.TestCase):
                               "No such file or directory", service.log())
                 self.assertEqual(service.counted("traces that failed"), 1)
 
-    def test_daemon_that_ends_at_once_is_told(self):
+    def test_daemon_that_ends_at_once_is_reported(self):
         with TracedService() as service:
             if not service.has_tracer():
                 self.skipTest("LTTng is not in this build")

@@ -125,7 +125,7 @@ class PlayedVolumeTest(unittest.TestCase):
         playing = [payload["RQSessionVolumePlayingState"] for payload in self.payloads("Volume.State")]
         self.assertEqual(playing, [1, 1, 0])
 
-    def test_the_summary_of_a_stream_with_a_hostile_name_tells_of_its_intervals(self):
+    def test_the_summary_of_a_stream_with_a_hostile_name_has_its_intervals(self):
         before = files_outside(self.service)
         begun = time.time()
 
