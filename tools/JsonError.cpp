@@ -61,7 +61,7 @@ std::string_view sentenceOf(int code) {
       return "wrong encoding; expected UTF-8 without control characters in the string";
     case rapidjson::kParseErrorNumberTooBig:
       return "the number is too large";
-    default:  // the rest has an expectation, or says nothing
+    default:  // other codes have an expectation or give no reason
       return "this is not JSON";
   }
 }

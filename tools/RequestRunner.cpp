@@ -202,16 +202,16 @@ ExitStatus RequestRunner::run(const Request& request, bool json, const std::stri
     auto opened = client::HalvoxConnection::open(std::get<std::string>(socket), options_.timeout);
     if (!opened) return Execution(*this, json, prefix).complain(command, *opened.failure);
     connection_ = std::move(*opened.value);
-    sayWhatWasPassedOver();
+    warnOfUnservedSockets();
   }
   return std::visit(Execution(*this, json, prefix), request);
 }
 
-// Warns that places before this one have sockets that nobody serves: the user may expect another
-// service.
-void RequestRunner::sayWhatWasPassedOver() {
+// Warns of sockets at earlier places on which no service listens: the user may expect one of those
+// services.
+void RequestRunner::warnOfUnservedSockets() {
   for (const std::string& path : connection_->unservedSockets()) {
-    errors_ << "halvoxctl: nobody serves " << harmlessText(path) << "; using "
+    errors_ << "halvoxctl: no service listens on " << harmlessText(path) << "; using "
             << harmlessText(connection_->socketPath()) << '\n';
   }
 }

@@ -25,7 +25,7 @@ class RequestRunner {
  private:
   class Execution;
 
-  void sayWhatWasPassedOver();
+  void warnOfUnservedSockets();
 
   CommonOptions options_;
   std::ostream& out_;

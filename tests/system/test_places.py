@@ -146,7 +146,7 @@ class ServicePlacesTest(Places):
         result = self.create_and_list(7)
 
         self.assertEqual(result.stdout, "7\n")
-        self.assertEqual(result.stderr, f"halvoxctl: nobody serves {self.user_socket}; "
+        self.assertEqual(result.stderr, f"halvoxctl: no service listens on {self.user_socket}; "
                                         f"using {SYSTEM_SOCKET}\n")
 
     def test_without_a_service_all_places_are_named_in_their_order(self):

@@ -88,13 +88,15 @@ void addLink(CommandSet& commands) {
                                .example = "halvoxctl link --session 7 --follow",
                                .reach = CommandReach::kFiles},
                               request);
-  addNumbers(link, "--session", request->ids, "Only messages of this session (-1: of none)");
-  addEach(link, "--category", request->categories, parseCategory,
-          "Only messages of this category, such as Session_Playback; without a domain, as in "
-          "Playback, of all domains; name or number")
+  addNumbers(link, "--session", request->ids,
+             "Only messages of this session (-1: those outside any session)");
+  addEach(
+      link, "--category", request->categories, parseCategory,
+      "Only messages of this category: a name such as Session_Playback, or a number. A category "
+      "without a domain, such as Playback, stands for all domains")
       ->type_name("CATEGORY");
   addEach(link, "--type", request->types, parseEventType,
-          "Only messages of this type, such as Start; name or number")
+          "Only messages of this type: a name such as Start, or a number")
       ->type_name("TYPE");
   addSelection(link, request->selection, "messages", "--service");
 }

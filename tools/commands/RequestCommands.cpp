@@ -198,7 +198,7 @@ void addScriptRequests(CommandSet& commands) {
   });
 
   CLI::App& sleep = commands.add(
-      {.name = "sleep", .summary = "Wait with the connection open", .example = "sleep 0.5"});
+      {.name = "sleep", .summary = "Wait; the connection stays open", .example = "sleep 0.5"});
   addParsed(sleep, "SECONDS", arguments->time, parseSeconds, "How long")->required();
   onRequest(commands, sleep, arguments, [](const Arguments& given) { return Sleep{*given.time}; });
 }

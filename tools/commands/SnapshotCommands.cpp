@@ -17,7 +17,7 @@ void addShow(CommandSet& commands, CLI::App& snapshots) {
   const auto request = std::make_shared<ShowSnapshot>();
   CLI::App& show =
       commands.addBelow(snapshots, {.name = "show",
-                                    .summary = "Show what a snapshot is about and what is in it",
+                                    .summary = "Show the signature and the contents of a snapshot",
                                     .example = "halvoxctl snapshots show newest --json",
                                     .reach = CommandReach::kFiles});
   addFile(show, request->file);
@@ -56,7 +56,7 @@ void addSnapshotCommands(CommandSet& commands) {
   list->kind = ShowRecords::Kind::kSnapshots;
   CLI::App& snapshots =
       commands.add({.name = "snapshots",
-                    .summary = "List, show or unpack what the service captured",
+                    .summary = "List, show or unpack snapshots that the service took",
                     .example = "halvoxctl snapshots --last 5\n  halvoxctl snapshots show newest",
                     .reach = CommandReach::kFiles});
   snapshots.require_subcommand(0, 1);
