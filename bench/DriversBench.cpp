@@ -104,7 +104,7 @@ double milliseconds(Clock::duration time) {
   return std::chrono::duration<double, std::milli>(time).count();
 }
 
-void tell(const char* what, std::vector<double>& times) {
+void printTimes(const char* what, std::vector<double>& times) {
   std::ranges::sort(times);
   std::printf("%-42s median %8.3f ms, p95 %8.3f ms, worst %8.3f ms\n", what,
               times[times.size() / 2], times[times.size() * 95 / 100], times.back());
@@ -124,8 +124,8 @@ void measureOne(const Sampler& sampler) {
     if (sampler.report(before) != kChannels) std::abort();
     reports.push_back(milliseconds(Clock::now() - stop));
   }
-  tell("snapshot, one session", snapShots);
-  tell("report, one session", reports);
+  printTimes("snapshot, one session", snapShots);
+  printTimes("report, one session", reports);
 }
 
 // Starts and stops all sessions on one queue, as the service does.
@@ -147,8 +147,8 @@ void measureQueue(const Sampler& sampler, const std::filesystem::path& directory
       reports.push_back(milliseconds(Clock::now() - start));
     }
   }
-  tell("snapshot, 64 sessions on one queue", snapShots);
-  tell("report, 64 sessions, files rewritten", reports);
+  printTimes("snapshot, 64 sessions on one queue", snapShots);
+  printTimes("report, 64 sessions, files rewritten", reports);
 }
 
 void measureThreads(const Sampler& sampler) {
@@ -172,8 +172,8 @@ void measureThreads(const Sampler& sampler) {
       });
     }
   }
-  tell("snapshot, 64 threads at once", snapShots);
-  tell("report, 64 threads at once", reports);
+  printTimes("snapshot, 64 threads at once", snapShots);
+  printTimes("report, 64 threads at once", reports);
 }
 
 void measureMemory(const Sampler& sampler) {

@@ -54,12 +54,12 @@ bool isFor(GroupPlace place, CommandSource source) {
 }
 
 // Removes the library's type name TEXT: the name of the argument already says what it is.
-void leaveTypesOut(CLI::App& app) {
+void removeTypeNames(CLI::App& app) {
   for (CLI::Option* option : app.get_options()) {
     if (option->get_positional()) option->type_name("");
   }
   for (CLI::App* below : app.get_subcommands([](const CLI::App*) { return true; })) {
-    leaveTypesOut(*below);
+    removeTypeNames(*below);
   }
 }
 
@@ -203,7 +203,7 @@ std::variant<Command, CommandLineText> parseCommandLine(std::vector<std::string>
   }
   app.require_subcommand(1);
   addGroups(commands, source);
-  leaveTypesOut(app);
+  removeTypeNames(app);
 
   std::ranges::reverse(arguments);  // as the library wants them
   // The library reports everything with exceptions. None leaves this function.

@@ -268,7 +268,7 @@ TEST(CommandLineTest, ArgumentsTooManyAreRefused) {
   EXPECT_NE(errorOf({}), "");
 }
 
-// All commands there are, as the answer to one that is none lists them; then those below others.
+// All commands, as the error about an unknown command lists them, followed by the sub-commands.
 std::vector<Words> allCommands() {
   std::istringstream list(errorOf({"nonesuch"}));
   std::vector<Words> commands;
@@ -325,7 +325,7 @@ TEST(CommandLineTest, HelpShowsTheSocketOnlyForRequestsToTheService) {
   }
 }
 
-// The completion is a file of its own, which forgets commands easily.
+// The completion is a separate file, in which a new command is easily forgotten.
 TEST(CommandLineTest, TheShellCompletesEveryCommand) {
   std::ifstream file(HALVOX_COMPLETION);
   const std::string text{std::istreambuf_iterator<char>(file), {}};

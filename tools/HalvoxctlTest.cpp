@@ -16,7 +16,7 @@
 #include "platform/linux/diagnostics/SnapshotArchive.h"
 #include "platform/linux/store/SqliteStore.h"
 
-// The built program, run against a service that plays along.
+// The built program, run against a fake service.
 namespace halvox::tools {
 namespace {
 

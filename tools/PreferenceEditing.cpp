@@ -86,7 +86,7 @@ std::size_t lineEnd(std::string_view text, std::size_t offset) {
 
 // Returns true for a value that is written as "key = value". Tables may also be written with
 // headers or dotted keys; changing those would need more than the lines of the key.
-bool standsBehindItsKey(const toml::node& node) {
+bool followsItsKey(const toml::node& node) {
   const toml::table* table = node.as_table();
   if (table != nullptr) return table->is_inline();
   const toml::array* array = node.as_array();
@@ -124,7 +124,7 @@ class ParsedText {
     std::size_t afterKeys = 0;
     std::size_t firstTable = text_.size();
     for (const auto& [key, node] : root()) {
-      if (standsBehindItsKey(node)) {
+      if (followsItsKey(node)) {
         afterKeys = std::max(afterKeys, lineEnd(text_, end(node)));
       } else {
         firstTable = std::min(firstTable, lineStart(text_, offsetOf(text_, key.source().begin)));
@@ -172,7 +172,7 @@ Result<PreferenceValue> parsePreferenceValue(std::string_view text, ValueForm fo
     const std::string line = std::string(kKey) + std::string(text);
     const toml::parse_result parsed = toml::parse(line);
     // Text that contains a comment, or more than one value, is a string that looks like TOML.
-    if (parsed && parsed.table().size() == 1 && standsBehindItsKey(*parsed.table().get("v")) &&
+    if (parsed && parsed.table().size() == 1 && followsItsKey(*parsed.table().get("v")) &&
         offsetOf(line, parsed.table().get("v")->source().end) == line.size()) {
       return PreferenceValue{std::string(text), toValue(*parsed.table().get("v"))};
     }
@@ -188,7 +188,7 @@ Edited withPreference(std::string_view text, std::string_view key, const Prefere
   expected.set(key, value.value);
   std::string edited;
   if (const toml::node* old = parsed.root().get(key)) {
-    if (!standsBehindItsKey(*old)) return parsed.refusal(key);
+    if (!followsItsKey(*old)) return parsed.refusal(key);
     edited = std::string(text.substr(0, parsed.begin(*old))) + value.text;
     edited += text.substr(parsed.end(*old));
   } else {
@@ -203,7 +203,7 @@ Edited withoutPreference(std::string_view text, std::string_view key,
   if (!parsed.isValid()) return parsed.mistake();
   const toml::node* old = parsed.root().get(key);
   if (old == nullptr) return std::string(text);
-  if (!standsBehindItsKey(*old)) return parsed.refusal(key);
+  if (!followsItsKey(*old)) return parsed.refusal(key);
   Dictionary expected = toDictionary(parsed.root());
   expected.remove(key);
   const std::size_t place = parsed.root().find(key)->first.source().begin

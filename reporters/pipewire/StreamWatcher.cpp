@@ -119,7 +119,7 @@ class StreamWatcher::Impl final : public StreamListener, private pipewire::Serve
 
   struct Stream {
     Properties announced;  // from the registry; the stream's client cannot change these
-    bool told = false;     // whether the tracker knows the stream
+    bool isKnown = false;  // to the tracker
     std::unique_ptr<StreamBinding> binding;
   };
 
@@ -128,7 +128,7 @@ class StreamWatcher::Impl final : public StreamListener, private pipewire::Serve
   Options options_;
   spa_source* const retry_;
   milliseconds pause_ = kReconnectMin;
-  bool waitingTold_ = false;
+  bool waitingLogged_ = false;
   pipewire::UniqueContext context_;
   pipewire::ServerConnection server_;
   std::unordered_map<GlobalID, Stream> streams_;
@@ -147,7 +147,7 @@ void StreamWatcher::Impl::connect() {
     return;
   }
   // Logged once for each time without a server, not at each attempt.
-  if (!std::exchange(waitingTold_, true)) {
+  if (!std::exchange(waitingLogged_, true)) {
     options_.log(fmt::format("waiting for PipeWire: {}", platform::linux_::errnoText(errno)));
   }
   retryAfter(pause_);
@@ -184,7 +184,7 @@ void StreamWatcher::Impl::addNode(GlobalID id, const Properties& properties) {
   }
   Stream& stream = streams_[id];
   stream.announced = properties;
-  stream.told = false;
+  stream.isKnown = false;
   stream.binding = std::make_unique<StreamBinding>(server_.registry(), id, *this);
   updateProfiler();
 }
@@ -214,7 +214,7 @@ void StreamWatcher::Impl::onProfile(const spa_pod* profile) {
 void StreamWatcher::Impl::clientChanged(GlobalID id) {
   for (const auto& [streamID, stream] : streams_) {
     // The properties of a client may arrive after those of its streams.
-    if (stream.told && idProperty(stream.binding->properties(), kClientIDProperty) == id) {
+    if (stream.isKnown && idProperty(stream.binding->properties(), kClientIDProperty) == id) {
       tracker_.streamPropertiesChanged(streamID, fullProperties(stream.binding->properties()));
     }
   }
@@ -232,7 +232,7 @@ void StreamWatcher::Impl::onStreamProperties(GlobalID id, const Properties& prop
   }
   Stream& stream = found->second;
   const Properties all = fullProperties(properties);
-  if (std::exchange(stream.told, true)) {
+  if (std::exchange(stream.isKnown, true)) {
     tracker_.streamPropertiesChanged(id, all);
     return;
   }
@@ -266,7 +266,7 @@ void StreamWatcher::Impl::onRetry(void* data, std::uint64_t /*expirations*/) {
 
 void StreamWatcher::Impl::onServerReached(const pw_core_info& server) {
   pause_ = kReconnectMin;
-  waitingTold_ = false;
+  waitingLogged_ = false;
   options_.log(fmt::format("following PipeWire {} ({})", server.version, server.name));
   tracker_.serverConnected(server.cookie);
 }
