@@ -172,7 +172,7 @@ void HVReportingClientServerInstance::carryOutStop(ReporterID reporterID, const 
 
 void HVReportingClientServerInstance::end(const Session& session, const Delegate& delegate) {
   // The driver messages come first, because only a started session records and forwards them. The
-  // snapshot is used up then. The held reply of the start precedes the reply to this stop.
+  // snapshot is not needed after them. The held reply of the start precedes the reply to this stop.
   if (delegate != nullptr) delegate->sendDriverLogsForSession(session);
   session->setDriverSnapShot(std::nullopt);
   session->stop();

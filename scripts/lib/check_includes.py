@@ -90,7 +90,7 @@ class Table:
             return None
         while parts:
             if "/".join(parts) in self.rows:
-                # platform/linux is a row for its own files only: each adapter has one.
+                # The row platform/linux is for its own files only: each adapter has a row too.
                 if parts == ["platform", "linux"] and path.count("/") > 2:
                     return None
                 return "/".join(parts)
@@ -119,8 +119,8 @@ class Table:
         folder = self.folder_of(path)
         row = self.rows[folder]
         of_file = self.rows.get(path, Row())
-        # The first that allows it is the one that is used: an arrow for tests that the folder has
-        # anyway would be reported as unused.
+        # Only the first arrow that allows it counts as used. An arrow for tests that repeats an
+        # arrow of the folder is therefore reported as unused.
         kinds = [row.everything, of_file.everything]
         if path.endswith((".cpp", ".c")):
             kinds.append(row.sources)

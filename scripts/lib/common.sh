@@ -148,7 +148,7 @@ halvox_progress_in() {
 # Shows progress: a spinner with the seconds at a terminal, a line every ten seconds elsewhere. If
 # the command fails, prints the end of its output and returns its status. The log is temporary.
 halvox_run() {
-  # shellcheck disable=SC1003  # that is a backslash, no quoting
+  # shellcheck disable=SC1003  # a backslash, not a quote
   local what=$1 log=$2 pid status=0 begin=$SECONDS told=0 ticks=0 spinner='|/-\'
   shift 2
   : >"$log"

@@ -18,7 +18,7 @@ def include(name):
 
 
 class TheTableOfThisTree(unittest.TestCase):
-    """The real table, asked about include lines that nobody has written."""
+    """The real table, applied to include lines that no file has."""
 
     def setUp(self):
         self.table = Table(TABLE.read_text(encoding="utf-8"))

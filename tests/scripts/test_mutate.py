@@ -1,4 +1,4 @@
-"""scripts/mutate: which mutants it makes, and that it tells those that are noticed from the others."""
+"""scripts/mutate: which mutants it makes, and which of them it reports as killed."""
 
 import random
 import shutil

@@ -1,5 +1,5 @@
-// A program that an audio framework could be: emits trace points and tells on standard output, as
-// JSON, how long it measured between them itself. For the tests of tracing.
+// Plays an audio framework in the tests of tracing: emits trace points, and prints as JSON the
+// times between them that it measured itself.
 //
 //   halvox_trace_client intervals PAIRS    four threads, each its own spacing
 //   halvox_trace_client flood EVENTS RATE  pairs from two threads, so many events a second in all

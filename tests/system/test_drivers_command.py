@@ -76,13 +76,13 @@ class DriversCommandTest(unittest.TestCase):
     def test_watching_shows_the_change_per_second_until_the_output_is_closed(self):
         write(self.directory, pulses(1000))
         command = self.watch("0.05")
-        # After the first line, every change is in some line.
+        # The first line shows that watching has begun: later changes are shown.
         self.assertEqual(json.loads(command.stdout.readline())["value"], 0)
         write(self.directory, pulses(1600))
 
         # The number of lines may vary, but each change is in one of them: their sum is exact.
         changes = []
-        wait_for("600 pulses to be told", lambda: changes.append(
+        wait_for("600 pulses to be shown", lambda: changes.append(
             (line := json.loads(command.stdout.readline()))["value"] * line["seconds"])
             or sum(changes) > 599, pause=0)
         changes += [json.loads(command.stdout.readline())["value"] for _ in range(3)]

@@ -1,4 +1,4 @@
-"""A link without back-ends: the session logs that once and drops its messages; nobody else notices."""
+"""A link without back-ends: the session logs that once and drops its messages; no other client notices."""
 
 import json
 import re
@@ -67,7 +67,7 @@ class AbsentLinkTest(unittest.TestCase):
               f"with a back-end {statistics.median(expected) * 1e6:.0f} us, "
               f"longest {max(taken) * 1e3:.1f} and {max(expected) * 1e3:.1f} ms", flush=True)
         self.assertLess(statistics.median(taken), 2 * statistics.median(expected))
-        # Nobody waits for the discovery.
+        # No answer waits for the discovery.
         self.assertLess(max(taken), ATTEMPT)
         self.assertEqual(len(service.wait_for_events(2 * MESSAGES)), 2 * MESSAGES)
 

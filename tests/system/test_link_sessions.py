@@ -164,7 +164,7 @@ class LinkOrder(LinkTest):
             lines += [word for word in (WAITING, LIST, NONE, CONTINUING, FAILED) if word in line]
         return lines
 
-    def check_order(self, config, told, outcome):
+    def check_order(self, config, answer, outcome):
         """The log lines of each start are in the order of the steps."""
         service = self.service_with(config)
         client = self.client(service)
@@ -173,7 +173,7 @@ class LinkOrder(LinkTest):
             wait_for("the end of the start", lambda: self.link_lines(service).count(outcome) == number)
             client.stop(number)
             started.wait()
-        self.assertEqual(self.link_lines(service), [WAITING, told, outcome] * self.ROUNDS)
+        self.assertEqual(self.link_lines(service), [WAITING, answer, outcome] * self.ROUNDS)
 
     def test_local_link_waits_before_it_lists(self):
         self.check_order("", LIST, CONTINUING)

@@ -14,7 +14,7 @@ from harness import BIN, SERVICE, Service, WITH_US, wait_for
 EX_CONFIG = 78
 REPORTER = 7
 NATS, TRACING, PIPEWIRE = "halvox-link-nats.so", "halvox-tracing-lttng.so", "halvox-drivers-pipewire.so"
-# Nobody listens there.
+# No server listens there.
 NATS_CONFIG = '[link]\nbackend = "nats"\nservers = ["nats://127.0.0.1:1"]\n'
 TRACING_CONFIG = "[features.Acoustat]\nTracing = true\n"
 HEAVY = ("libnats", "libssl", "libcrypto", "libbabeltrace2", "liblttng-ctl", "libpipewire",

@@ -119,7 +119,7 @@ class RealAudioTest(unittest.TestCase):
             audio.Reporter(self.audio, self.service, "--no-xruns"))
         self.play(30)
         self.wait_for_message("Volume.State")
-        wait_for("the reporter to come to rest", lambda: self.wake_ups(seconds=0.5) == 0)
+        wait_for("the reporter to become idle", lambda: self.wake_ups(seconds=0.5) == 0)
 
         self.assertEqual(self.wake_ups(seconds=2), 0)
 

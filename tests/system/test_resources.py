@@ -43,7 +43,7 @@ class Resources(unittest.TestCase):
         self.assertEqual(self.service.voluntary_switches() - settled, 0)
 
     def settled_switches(self):
-        """The count after it has not changed for a second."""
+        """Waits until the count has not changed for a second, and returns it."""
         count = self.service.voluntary_switches()
         for _ in range(30):
             time.sleep(1)
@@ -51,7 +51,7 @@ class Resources(unittest.TestCase):
             if now == count:
                 return now
             count = now
-        self.fail("the service does not come to rest")
+        self.fail("the service does not become idle")
 
     def test_flood_is_bounded_and_others_are_still_answered(self):
         quiet = self.client()

@@ -123,13 +123,13 @@ class Settings(unittest.TestCase):
         for session in (101, 102):
             client.create(session)
         delays = []
-        # A busy machine may delay us now and then, but not each time.
+        # A busy machine may delay some of the tries, but not all.
         for number in range(5):
             mark = self.mark()
             self.set_device_name(f"number {number}")
             changed = self.file.stat().st_mtime
             delays.append(max(self.wait_for_message(mark, session) for session in (101, 102)) - changed)
-            # Whatever else the change causes belongs to it and not to the next one.
+            # Wait for everything that this change causes, so that it does not disturb the next one.
             self.wait_for_state(mark, f"number {number}")
 
         self.assertLess(min(delays), SOON, delays)
@@ -170,7 +170,7 @@ class Settings(unittest.TestCase):
 
     def test_one_save_is_one_message_however_it_is_saved(self):
         self.ctl("notify", NOTIFICATION)
-        # Settled together with or after everything that the line above has caused.
+        # The state of this change comes with or after everything that the post has caused.
         self.set_device_name("one")
         self.wait_for_state(0, "one")
         client = self.client()
@@ -261,7 +261,7 @@ class Settings(unittest.TestCase):
             self.wait_for_change(mark)
             if round_ > 0:
                 self.assertIn("exists again; watching it", self.log_since(mark))
-            # Settled together with or after everything that the post has caused.
+            # The state of this change comes with or after everything that the post has caused.
             self.set_device_name(f"round {round_}")
             self.wait_for_state(mark, f"round {round_}")
             mark = self.mark()

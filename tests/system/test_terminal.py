@@ -182,7 +182,7 @@ class FollowTest(WithService):
                 return follower.so_far()
             records = wait_for("a record", shown, pause=0.1)
 
-            # Nothing that the session in the script sent.
+            # The records of the script are older and are not shown.
             self.assertTrue(all("news" in record["payload"] for record in records), records)
 
 

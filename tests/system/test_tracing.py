@@ -103,7 +103,7 @@ class KernelTraceTest(unittest.TestCase):
                     stdin=subprocess.PIPE, stdout=subprocess.PIPE)
                 try:
                     self.assertEqual(client.stdout.readline(), "ready\n")
-                    # Nobody empties the buffers meanwhile.
+                    # Until it continues, the buffers are not emptied.
                     consumers = [pid for pid, name in children_of(daemon)
                                  if name.startswith("lttng-consumer")]
                     self.assertEqual(len(consumers), 1)

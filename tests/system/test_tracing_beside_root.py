@@ -38,21 +38,21 @@ class BesideRootsDaemonTest(unittest.TestCase):
             cwd=HERE, env={**os.environ, "PYTHONPATH": f"{HERE}:{KDEBUG}", "HALVOX_BIN": str(BIN)},
             stdout=subprocess.PIPE, stderr=subprocess.STDOUT, text=True, timeout=240, check=False)
         self.assertEqual(done.returncode, 0, done.stdout)
-        told = json.loads(done.stdout.splitlines()[-1])
-        self.assertEqual(set(told["statuses"]), {0}, done.stdout)
+        report = json.loads(done.stdout.splitlines()[-1])
+        self.assertEqual(set(report["statuses"]), {0}, done.stdout)
         self.assertNotIn("skipped", done.stdout.lower())
-        return told
+        return report
 
     def test_one_that_hangs_is_not_met(self):
-        told = self.run_beside("hangs")
+        report = self.run_beside("hangs")
 
-        self.assertGreater(told["met before"], 0)
-        self.assertEqual(told["met"], 0)
+        self.assertGreater(report["met before"], 0)
+        self.assertEqual(report["met"], 0)
 
     def test_one_that_records_keeps_its_session_and_gets_no_other(self):
-        told = self.run_beside("records")
+        report = self.run_beside("records")
 
-        self.assertEqual(told["sessions"], ["roots"])
+        self.assertEqual(report["sessions"], ["roots"])
 
 
 if __name__ == "__main__":

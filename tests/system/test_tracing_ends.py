@@ -77,7 +77,7 @@ class EndOfServiceTest(unittest.TestCase):
             service.stop(signal.SIGKILL)
 
             client.close()
-            wait_for("the service's sessions to go", lambda: ") halvox-" not in service.sessions())
+            wait_for("the service's sessions to be destroyed", lambda: ") halvox-" not in service.sessions())
             self.assertIn("other", service.sessions())
             self.assertTrue(is_running(processes[0]))
 

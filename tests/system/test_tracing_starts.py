@@ -1,4 +1,4 @@
-"""The start of a traced session delays nobody, whatever the tracer's daemon does."""
+"""The start of a traced session delays no other client, whatever the tracer's daemon does."""
 
 import contextlib
 import select
@@ -13,8 +13,8 @@ from tracing import REPORTER, TEST, TracedService, require_tracer
 # seven times as much.
 BOUND = 0.050
 TRIES = 5  # a busy machine may spoil all but one
-REQUESTS = 100  # calls at least, while the session starts
-STARTS_WITHIN = 5.0  # seconds; the measurement ends then at the latest
+REQUESTS = 100  # the least number of requests in a measurement
+STARTS_WITHIN = 5.0  # seconds, after which the measurement ends in any case
 
 
 def setUpModule():
@@ -48,7 +48,7 @@ def silent_daemon(service):
 
 class StartTest(unittest.TestCase):
     def worst_answer(self, client, goes_on):
-        """How long the client waited for an answer at most, in seconds. At least REQUESTS answers."""
+        """The longest of at least REQUESTS waits for an answer, in seconds."""
         worst = 0.0
         requests = 0
         while requests < REQUESTS or goes_on():
@@ -59,8 +59,8 @@ class StartTest(unittest.TestCase):
         return worst
 
     def wait_added_by_a_start(self, service, trace_type, has_started):
-        """How much longer another client waited for an answer at most, in seconds, until
-        has_started(), than twice the worst before the start. A busy machine makes both wait."""
+        """By how many seconds the longest wait of another client, until has_started(), exceeds twice
+        its longest wait before the start. A busy machine makes both longer."""
         client = service.client()
         other = service.client()
         before = self.worst_answer(other, lambda: False)

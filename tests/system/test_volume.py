@@ -115,7 +115,7 @@ class PlayedVolumeTest(unittest.TestCase):
     def test_three_seconds_at_one_volume_and_two_at_another_are_two_intervals(self):
         intervals, played = self.play_at_two_volumes(first=3, then=2)
 
-        print("\nplayed", played, "told", [interval["play_seconds"] for interval in intervals], flush=True)
+        print("\nplayed", played, "reported", [interval["play_seconds"] for interval in intervals], flush=True)
         self.assertEqual([interval["RQSessionVolume"] for interval in intervals], [0.5, 0.25])
         for interval, seconds in zip(intervals, played, strict=True):
             self.assertAlmostEqual(interval["play_seconds"], seconds, delta=TOLERANCE)

@@ -179,7 +179,7 @@ def is_running(pid):
     zombie."""
     try:
         return ") Z " not in Path(f"/proc/{pid}/stat").read_text()
-    except (FileNotFoundError, ProcessLookupError):  # the latter when it goes while read
+    except (FileNotFoundError, ProcessLookupError):  # the latter if it ends while it is read
         return False
 
 

@@ -1,1 +1,1 @@
-"""Changes sources in small ways and looks whether the tests notice. See scripts/mutate."""
+"""Changes sources in small ways and checks whether the tests fail. See scripts/mutate."""

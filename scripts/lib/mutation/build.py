@@ -1,7 +1,7 @@
-"""A built copy of the tree, and programs of it in which one source is another.
+"""A built copy of the tree, and its test programs with one changed source.
 
-The copy is built once. For a mutant only the sources that contain it are compiled again, beside the
-copy, and the test programs linked with these in the place of their own objects.
+The copy is built once. For a mutant, only the objects that contain it are compiled again, outside the
+copy. Each test program is then linked with these in place of its own objects.
 """
 
 import json
@@ -15,9 +15,9 @@ import subprocess
 import time
 from pathlib import Path
 
-# What a test program of a mutant may take: a mutant that never ends counts as noticed. Loops are
-# found by the processor's time, which does not depend on what else the machine does; a program that
-# waits for ever gets much longer, so that a busy machine does not look like a failing test.
+# Limits for a test program of a mutant. A mutant that never ends counts as killed. A loop is found by
+# its CPU time, which does not depend on other work of the machine. A program that waits for ever gets
+# much more time, so that a busy machine does not look like a failing test.
 SHORTEST_LIMIT = 20.0  # seconds of the processor's time
 LIMIT_FACTOR = 10  # of the time that the program takes unchanged
 WAIT_FACTOR = 10  # how many times the limit a program may take in all
@@ -25,7 +25,7 @@ SLOW_TEST = 0.4  # seconds; such tests run when all others have passed
 MEMORY_LIMIT = 8 << 30  # bytes of address space
 COMPILE_LIMIT = 300.0
 
-# The allocator fills fresh and freed memory with this byte, so that code which reads it is noticed.
+# The allocator fills new and freed memory with this byte, so that tests fail if code reads it.
 _TEST_ENVIRONMENT = {"MALLOC_PERTURB_": "165"}
 _TEST = re.compile(r"^\s*halvox_test\(\s*(\w+)", re.MULTILINE)
 
@@ -159,8 +159,8 @@ class Tree:
         return [one for one in self._includes.get(file, []) if program.contains(one)]
 
     def compile(self, one, file, directory):
-        """Compiles an object again with the mutant of `file` below `directory`; the new object, or
-        None if the mutant does not compile."""
+        """Compiles an object again with the mutant of `file` below `directory`. Returns the new
+        object, or None if the mutant does not compile."""
         command = self._compile[one]
         to = directory / one.replace("/", "_")
         words = shlex.split(command["command"])
@@ -195,8 +195,9 @@ class Program:
         return one in self._link or self.links(f"lib{target}.a")
 
     def link(self, objects, to):
-        """Links with other objects: those of libraries come first, so that the linker needs no
-        others for the same names. True when that worked."""
+        """Links the program with these objects in place of its own. They come before the libraries,
+        so that the linker does not take the libraries' objects for the same names. Returns True on
+        success."""
         words = [str(objects.get(word, word)) for word in self._link]
         words[words.index("-o") + 1] = str(to)
         extra = [str(new) for one, new in objects.items() if one not in self._link]
@@ -222,7 +223,7 @@ class Program:
         seconds = math.ceil(limit)
         command = ["prlimit", f"--cpu={seconds}", f"--as={MEMORY_LIMIT}", "--core=0", "--",
                    str(path), "--gtest_fail_fast", f"--gtest_filter={tests}"]
-        # Where it runs unchanged: a compiler may have made the paths that tests read relative to it.
+        # In the directory of the build, to which the paths that tests read may be relative.
         return run(command, self._build, WAIT_FACTOR * limit, {**os.environ, **_TEST_ENVIRONMENT})
 
     def fails(self, path, slow=False):

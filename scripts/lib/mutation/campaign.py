@@ -1,4 +1,4 @@
-"""Chooses mutants, tries them, and reports what became of them."""
+"""Chooses mutants, tries them, and reports the results."""
 
 import collections
 import random
@@ -39,7 +39,7 @@ def sources_in(root, folders):
 
 
 class Choice:
-    """The mutants of a file in a random order of their places, then those of the places again."""
+    """The mutants of a file: one of each place in random order, then the next one of each place."""
 
     def __init__(self, file, places, generator):
         self.file = file
@@ -160,7 +160,7 @@ class Campaign:
 
 
 def report(outcomes, folders, say):
-    """Prints the survivors and a table; the outcomes that compiled."""
+    """Prints the survivors and a table. Returns the outcomes of the mutants that compiled."""
     compiled = [one for one in outcomes if one.state != NOT_COMPILED]
     survivors = sorted((one for one in compiled if one.state == SURVIVED),
                        key=lambda one: (one.mutant.file, one.mutant.start, one.mutant.kind))

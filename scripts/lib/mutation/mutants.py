@@ -99,7 +99,7 @@ def _words(token, before, after):
 def _marks(text, token):
     if token.text in {"++", "--"}:
         return "arithmetic", [_ARITHMETIC[token.text]]
-    # A mark between blanks is an operator of two values, not part of a type.
+    # A mark between blanks is a binary operator, not part of a type.
     spaced = text[token.start - 1] in " \n" and text[token.end:token.end + 1] in (" ", "\n")
     if token.text == "!":
         return "negation", [""]

@@ -1,7 +1,7 @@
 """The text of a C++ source as tokens, and the statements of its blocks.
 
-Not a compiler: it knows as much of the language as clang-format leaves to know. A mutant that this
-gets wrong does not compile, and such mutants do not count.
+Not a compiler: it relies on the layout that clang-format gives to sources. If it misreads one, the
+mutant does not compile, and such mutants do not count.
 """
 
 import re
@@ -57,7 +57,7 @@ class Source:
 
     text: str
     tokens: list = field(init=False)
-    partners: dict = field(init=False)  # of each bracket, its other one
+    partners: dict = field(init=False)  # each bracket's position -> that of its partner
 
     def __post_init__(self):
         self.tokens = _tokens_of(self.text)
@@ -90,7 +90,7 @@ class Source:
         while position < end:
             statement = self._statement(position, end)
             if statement is None:
-                break  # nothing that we can make sense of
+                break  # not understood
             statements.append(statement)
             position = statement.last + 1
         return statements
