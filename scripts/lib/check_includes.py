@@ -97,8 +97,8 @@ class Table:
             parts.pop()
         return None
 
-    def circle(self) -> list[str]:
-        """The folders of a circle of arrows that hold for headers; empty if there is none."""
+    def cycle(self) -> list[str]:
+        """The folders of a cycle of arrows that hold for headers; empty without a cycle."""
         done: set[str] = set()
 
         def visit(name: str, path: list[str]) -> list[str]:
@@ -213,8 +213,8 @@ def main(arguments: list[str]) -> int:
     for number, what in table.unused():
         print(f"{table_file.name}:{number}: {what}")
         count += 1
-    if circle := table.circle():
-        print(f"{table_file.name}: the arrows form a circle: {' -> '.join(circle)}")
+    if cycle := table.cycle():
+        print(f"{table_file.name}: the arrows form a cycle: {' -> '.join(cycle)}")
         count += 1
     print(f"includes: {len(files)} files read, {count} breaches")
     return 1 if count or not files else 0

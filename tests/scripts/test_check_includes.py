@@ -34,8 +34,8 @@ class TheTableOfThisTree(unittest.TestCase):
     def assertAllowed(self, path, text):
         self.assertEqual(self.breaches(path, text), [])
 
-    def test_arrows_do_not_form_a_circle(self):
-        self.assertEqual(self.table.circle(), [])
+    def test_arrows_do_not_form_a_cycle(self):
+        self.assertEqual(self.table.cycle(), [])
 
     def test_inner_ring_does_not_reach_the_adapters(self):
         for folder in ("session", "backends", "driver", "tracing", "service", "platform"):
@@ -123,8 +123,8 @@ class TableMistakes(unittest.TestCase):
 
         self.assertEqual(list(table.unused()), [(3, "a does not include <lib/>; remove it from the row")])
 
-    def test_circle_is_found(self):
-        self.assertEqual(Table("a: b\nb: c\nc: a\n").circle(), ["a", "b", "c", "a"])
+    def test_cycle_is_found(self):
+        self.assertEqual(Table("a: b\nb: c\nc: a\n").cycle(), ["a", "b", "c", "a"])
 
     def test_lines_that_cannot_be_understood_are_named(self):
         for text, reason in (("a\n", "line 1: expected"), ("a:\na:\n", "line 2: a has a row"),
