@@ -39,8 +39,8 @@ std::string serviceHelp(std::string_view configurationFile) {
          "  -h, --help  Print this help\n"
          "  --version   Print the version\n"
          "\n"
-         "All settings are in a TOML file; without it they have their defaults. The service\n"
-         "would now read\n"
+         "All settings are in a TOML file. Without it they have their defaults. The service\n"
+         "would now read this file:\n"
          "  " +
          std::string(configurationFile) +
          "\n"

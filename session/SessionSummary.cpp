@@ -33,8 +33,7 @@ void SessionSummary::sendVolumeMessages(const Send& send) const {
     const SessionHistory::Lock history = history_.lock();
     return history->has_value() ? walk.next(**history) : std::nullopt;
   };
-  // The line below comes before the messages and only if there are any, so the first is found
-  // before it is logged.
+  // Logged once, before the first message, and only if there is one.
   Message message = next();
   if (!message.has_value()) return;
   kSessionLog.notice("sending volume event for reporter ", number(profile_.reporterID()));

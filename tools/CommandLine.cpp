@@ -150,7 +150,7 @@ std::string listCommands(const CLI::App& app) {
   return list;
 }
 
-// Returns what is wrong, in our words where the library's do not help.
+// Returns what is wrong: the library's message, or our own if a command is missing or unknown.
 std::string reasonOf(const CLI::ParseError& error, const CLI::App& app, const CLI::App& command) {
   const bool isWithoutCommand = dynamic_cast<const CLI::RequiredError*>(&error) != nullptr &&
                                 command.get_require_subcommand_min() > 0 &&

@@ -9,9 +9,10 @@
 
 namespace halvox::tools {
 
-// Returns the configuration of the service that this user's programs find. If it does not name a
-// storage directory, that is the user's if it holds a store, else the system's if that holds one,
-// else the user's. If the configuration is wrong, reports it and returns the exit status.
+// Returns the configuration of the service that this user's programs find. If it names no storage
+// directory, the result has the first of the user's and the system's directory that holds a store,
+// or the user's if neither does. If the configuration is wrong, reports it and returns the exit
+// status.
 std::variant<platform::linux_::Configuration, ExitStatus> serviceConfiguration(
     const Complaint& complain);
 

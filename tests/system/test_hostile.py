@@ -96,7 +96,7 @@ class Hostile(unittest.TestCase):
             with self.subTest(signature=signature):
                 with self.assert_error(INVALID_ARGS, "culprit", signature):
                     self.client().send({"fine": signature, "culprit": value}, reporters=[1000])
-                # Whatever the refused message caused was stored before this fence.
+                # What the refused message could have caused would be stored before this fence.
                 self.bystander.send({"fence": signature}, reporters=[1000])
                 self.service.wait_for_payload(lambda payload: payload.get("fence") == signature)
                 taken = [payload for _, payload in self.service.events()

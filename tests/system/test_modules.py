@@ -1,4 +1,4 @@
-"""Optional parts: what a service maps that needs none of them, and what it says when one is missing."""
+"""Optional parts: a service that needs none of them maps none, and it logs which one is missing."""
 
 import os
 import re

@@ -113,7 +113,7 @@ class ProtocolTests:
         child.send_signal(signal.SIGKILL)
         child.wait(harness.DEADLINE)
 
-        wait_for("the session to go", lambda: 91 not in client.reporters())
+        wait_for("the session to be dropped", lambda: 91 not in client.reporters())
 
     def test_every_message_is_recorded_under_both_names_in_order_with_its_payload(self):
         client = self.client()

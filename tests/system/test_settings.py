@@ -198,8 +198,8 @@ class Settings(unittest.TestCase):
                 self.assertEqual(len(re.findall(r"feature \d+ changes", self.log_since(mark))), 2)
 
     def save_at_once(self, save):
-        """Saves. If we were delayed, the save was two changes and is repeated. Returns the end of
-        the log before it."""
+        """Saves, again if a delay made two changes of one save. Returns the end of the log before
+        the save."""
         for number in range(20):
             mark = self.mark()
             begin = time.monotonic()

@@ -84,7 +84,7 @@ class KernelTraceTest(unittest.TestCase):
                 service.run_client("intervals", 1)
             wait_for_results(service)
 
-            wait_for("the scratch trace to go", lambda: not service.scratch())
+            wait_for("the scratch trace to be removed", lambda: not service.scratch())
             self.assertNotIn("halvox-", service.sessions())
             service.stop()
 
@@ -280,7 +280,7 @@ class ForgottenTraceTest(unittest.TestCase):
         self.assertIn("halvox-", service.sessions())
         client.destroy(REPORTER)
         wait_for("the recording to end", lambda: "halvox-" not in service.sessions())
-        wait_for("the scratch trace to go", lambda: not service.scratch())
+        wait_for("the scratch trace to be removed", lambda: not service.scratch())
         client.close()
 
     def test_performance_trace_of_a_session_that_became_a_runners(self):

@@ -24,7 +24,7 @@ class EndOfServiceTest(unittest.TestCase):
     def assert_gone(self, service, processes):
         for process in processes:
             wait_for("the end of the tracer's processes", lambda: not is_running(process))
-        wait_for("the note of the daemon to go", lambda: not service.note.exists())
+        wait_for("the note of the daemon to be deleted", lambda: not service.note.exists())
 
     def test_daemon_ends_with_a_service_that_cannot_write_its_results(self):
         with TracedService() as service:

@@ -23,7 +23,7 @@ def setUpModule():
 
 @contextlib.contextmanager
 def silent_daemon(service):
-    """A server in the place of the daemon that accepts and never answers.
+    """Takes the place of the daemon: accepts connections and never answers.
 
     Yields a function that returns after the service has connected.
     """

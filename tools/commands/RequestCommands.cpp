@@ -115,9 +115,10 @@ void addStart(CommandSet& commands) {
 Send makeSend(const Arguments& given) {
   if (given.isToAll == !given.ids.empty()) {
     throw CLI::ValidationError(
-        "--id", given.isToAll
-                    ? "cannot be combined with --all; expected one of the two"
-                    : "is missing; expected --id ID for some sessions or --all for the active");
+        "--id",
+        given.isToAll
+            ? "cannot be combined with --all; expected one of the two"
+            : "is missing; expected --id ID for some sessions or --all for all active ones");
   }
   Send send{
       .ids = {}, .category = given.category, .type = given.eventType, .message = given.dictionary};
