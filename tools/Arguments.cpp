@@ -17,7 +17,7 @@ std::optional<Number> parseWhole(std::string_view text) {
   if (text.starts_with("0x") || text.starts_with("0X")) {
     text.remove_prefix(2);
     base = 16;
-    if (text.starts_with('-')) return std::nullopt;  // a sign stands before the 0x, or nowhere
+    if (text.starts_with('-')) return std::nullopt;  // from_chars() would accept "0x-5"
   }
   Number number{};
   const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number, base);

@@ -85,8 +85,8 @@ TEST(CommandLineTest, ValuesThatAreNamedLikeCommandsAreValues) {
 
 TEST(CommandLineTest, SendNeedsEitherIDsOrAll) {
   EXPECT_EQ(errorOf({"send", "--category", "1", "--type", "1", "{}"}),
-            "halvoxctl send: --id: is missing; expected --id ID for some sessions or --all for the "
-            "active");
+            "halvoxctl send: --id: is missing; expected --id ID for some sessions or --all for all "
+            "active ones");
   EXPECT_EQ(errorOf({"send", "--all", "--id", "7", "--category", "1", "--type", "1", "{}"}),
             "halvoxctl send: --id: cannot be combined with --all; expected one of the two");
 }

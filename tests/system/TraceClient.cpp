@@ -2,8 +2,8 @@
 // times between them that it measured itself.
 //
 //   halvox_trace_client intervals PAIRS    four threads, each its own spacing
-//   halvox_trace_client flood EVENTS RATE  pairs from two threads, so many events a second in all
-//   halvox_trace_client burst EVENTS       says "ready", waits for a line on standard input, and
+//   halvox_trace_client flood EVENTS RATE  pairs from two threads, RATE events a second in all
+//   halvox_trace_client burst EVENTS       prints "ready", waits for a line on standard input, and
 //                                          emits pairs from one thread as fast as it can
 
 #include <array>

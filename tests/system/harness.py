@@ -1,7 +1,7 @@
 """Runs the built service in a scratch directory and talks to it with clients that are not ours.
 
-Everything that is started here is stopped here, by process ID. Waiting is always for a named
-condition with a deadline.
+Everything that is started here is stopped here, by process ID. Every wait is for a
+named condition and has a deadline.
 """
 
 import contextlib

@@ -208,7 +208,7 @@ class Snapshots(unittest.TestCase):
         # A busy machine may delay some answers, but not most of them.
         self.assertLess(sorted(waited)[len(waited) * 3 // 4], 1.0, waited)
         # Two reports make one request. Each request was accepted or refused, and that was logged.
-        counted = wait_for("an end of the last snapshot", lambda: next(
+        counted = wait_for("the end of the last snapshot", lambda: next(
             (now for now in [counters(service)]
              if now["delivered"] + now["dropped: another in work"] == 5000), None), pause=0.2)
         self.assertEqual(counted["received"], 5000)
