@@ -9,7 +9,8 @@ class LogCategory;
 
 namespace halvox {
 
-// The identifier that a client chose for its session.
+// The identifier that a client chose for its session. A type of its own, so that no other number
+// can be passed for it.
 enum class ReporterID : std::int64_t {};
 // Identifies no session.
 inline constexpr ReporterID kNoReporterID{0};

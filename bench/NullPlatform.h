@@ -63,6 +63,7 @@ class NullDeviceProperties final : public platform::DevicePropertyService {
   }
 };
 
+// All queues share one list, in which jobs run in the order of their submission.
 class ListQueue final : public platform::DispatchQueue {
  public:
   explicit ListQueue(std::deque<platform::Job>& jobs) : jobs_(jobs) {}

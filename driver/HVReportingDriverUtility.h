@@ -61,7 +61,9 @@ class HVReportingDriverUtility {
     DriverStats state;
   };
 
+  // Adds a subscription to the group, unless it has no channels or refuses.
   void subscribe(const HVReportingDriver& driver);
+  // Adds the channel to the message of its format; logs formats that are not reported.
   static void addChannel(const platform::IOReportChannel& channel, Stats& stats);
 
   std::vector<HVReportingIOChannelSubscription> ioChannelSubscriptions_;

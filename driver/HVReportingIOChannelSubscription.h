@@ -31,6 +31,7 @@ class HVReportingIOChannelSubscription {
   }
 
  private:
+  // The group that was asked for. Its description is the key of its samples in snapshots.
   HVReportingDriver driver_;
   platform::IOReportService::Subscription subscription_;
   platform::IOReportService::Channels subscribedChannels_;

@@ -95,6 +95,8 @@ class HVReportingClientServerInstance final
     ResourceCharge charge;  // for the message, until the request has been carried out
   };
 
+  // Queues `work`, which is called with this client, on the reporting queue. Keeps the client and
+  // the request's token until then.
   template <typename Work>
   void queueRequest(platform::JobWeight weight, RequestContext&& context, Work work);
 
@@ -113,11 +115,16 @@ class HVReportingClientServerInstance final
   void carryOutGetAllReporters(const ReportersReply& reply) const;
   void carryOutConnectionError();
 
+  // Starts a session that is not started, and holds `reply` back until its stop.
   void begin(const Session& session, const Delegate& delegate, const BoolReply& reply);
+  // Reports on and stops a started session, and delivers its held reply.
   void end(const Session& session, const Delegate& delegate);
+  // The three ways of a message: to the sessions that it names, to all started sessions if it names
+  // none, and to no session if none is started.
   void sendToNamedSessions(const MessageRequest& request, const Delegate& delegate) const;
   void sendToActiveSessions(const MessageRequest& request, const Delegate& delegate) const;
   void sendStandalone(const MessageRequest& request, const Delegate& delegate) const;
+  // Offers the message to each back-end once for this session.
   static void handToBackEnds(const MessageRequest& request, const Session& session,
                              const Delegate& delegate);
 

@@ -83,7 +83,9 @@ class HVReportingServiceDelegate final
   void offerState();
   // Describes the clients and their sessions, up to a bound. Reporting queue only.
   [[nodiscard]] platform::Dictionary describeState() const;
+  // Makes the client object of a connection, not registered yet.
   Client exportClient(platform::NSXPCConnection& connection);
+  // Adds the client to the list, and stores the time and its process's name. Reporting queue only.
   void registerClient(const Client& client);
 
   // Reads the defaults. Called once, by the constructor. Reads files.

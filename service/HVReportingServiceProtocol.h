@@ -33,6 +33,7 @@ class HVReportingServiceProtocol : public platform::ExportedObject {
   // under this ID, without stopping it.
   virtual void createReportingSession(ReporterID reporterID, BoolReply reply,
                                       RequestContext context) = 0;
+  // Sets the service type of one of the client's own sessions. Any number is accepted.
   virtual void setServiceType(AudioServiceType serviceType, ReporterID reportingSession,
                               BoolReply reply, RequestContext context) = 0;
   // Replies with the service type, not a name, and calls the reply twice for ID 0. Clients rely on
@@ -52,8 +53,12 @@ class HVReportingServiceProtocol : public platform::ExportedObject {
   virtual void sendMessage(platform::Message message, AudioEventCategory category,
                            AudioEventType type, ReporterIDs reporterIDs, ErrorReply reply,
                            RequestContext context) = 0;
+  // Stops one of the client's own sessions, which stays and can be started again. The held reply of
+  // the start comes first, then this one.
   virtual void stopReportingSessionForID(ReporterID reporterID, BoolReply reply,
                                          RequestContext context) = 0;
+  // Stops one of the client's own sessions if it is started, and drops it. The held reply of its
+  // start is never called.
   virtual void destroyReportingSession(ReporterID reporterID, BoolReply reply,
                                        RequestContext context) = 0;
   // Replies with "reporterID" and "serviceType" of a session; 0 and 65535 if there is none.

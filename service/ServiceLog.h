@@ -24,6 +24,7 @@ class ListDescription {
  public:
   ListDescription(const List& list, Append append) : list_(list), append_(append) {}
 
+  // Takes time in proportion to the text, not to the list.
   [[nodiscard]] std::string description() const {
     std::string text = "(";
     std::size_t left = list_.size();

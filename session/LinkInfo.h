@@ -21,6 +21,8 @@ struct LinkStart {
   std::string_view serviceName;  // a constant of the vocabulary
   platform::Dictionary configuration;
 
+  // Describes the session: its identifier, whether its messages may be batched, and the application
+  // if the configuration names one.
   [[nodiscard]] platform::Dictionary sessionInfo(
       ReporterID reporterID, const platform::TLMSecureHierarchyToken& token) const;
   // Includes the whole configuration, whose entries replace the service's own of the same key.

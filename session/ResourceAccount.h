@@ -18,6 +18,7 @@ namespace halvox {
 // messages still wait. Any thread may use it.
 class ResourceAccount {
  public:
+  // Every byte that is added must be removed once; the classes below do so.
   void addBytes(std::size_t bytes) { bytes_.fetch_add(bytes, std::memory_order_relaxed); }
   void removeBytes(std::size_t bytes) { bytes_.fetch_sub(bytes, std::memory_order_relaxed); }
   void setSessions(std::size_t sessions) { sessions_.store(sessions, std::memory_order_relaxed); }

@@ -58,6 +58,7 @@ class SessionLink {
 
   // Opens the link with the session's current type and configuration.
   void submitStart(const Owner& owner);
+  // Sends a message through the link, or as a single message if it was sent outside a run.
   void submit(const Owner& owner, LinkMessage message);
   // Flushes what the framework still holds and closes the link.
   void submitStop(const Owner& owner);
@@ -91,6 +92,7 @@ class SessionLink {
   void endStart(platform::WaitOutcome outcome);
   void stop(const Owner& owner);
   void endStop();
+  // Forgets the framework's session; the link sends nothing from then on.
   void drop();
   void handle(const LinkMessage& message);
   void sendThroughFramework(const LinkMessage& message);

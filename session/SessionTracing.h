@@ -71,6 +71,8 @@ class SessionTracing : public platform::KQTraceSessionDelegate {
   // runner. Waits for the disk.
   void setupTracing(const std::string& path);
 
+  // The framework's reports about its trace, on a thread of its own. A stop waits for the
+  // completion.
   void kqTraceDidStart(const std::optional<platform::Error>& error) override;
   void kqTraceDidStop(const std::optional<platform::Error>& error) override;
   void kqTraceDidComplete(const std::string& url, std::uint64_t token,

@@ -21,6 +21,7 @@ class SummaryEvent {
  public:
   explicit SummaryEvent(AudioServiceType serviceType);
 
+  // Appends the text of each value to those of its key.
   void add(const platform::Dictionary& message);
   // Returns the event and empties this object.
   [[nodiscard]] platform::Dictionary take();

@@ -21,6 +21,7 @@ enum class ReportingTracePoint : std::uint32_t {
   kMessageSent = 0x21044838,
 };
 
+// Emits the point with four arguments of 0, which is required.
 inline void emitTracePoint(ReportingTracePoint point) {
   platform::kdebug().kdebug_trace(static_cast<std::uint32_t>(point), 0, 0, 0, 0);
 }

@@ -39,6 +39,7 @@ class VolumeIntervals {
   std::optional<platform::Dictionary> add(const platform::Dictionary& message);
 
  private:
+  // The message of the interval that has just ended.
   [[nodiscard]] platform::Dictionary makeMessage(double seconds) const;
 
   const double minimumPlaytime_;

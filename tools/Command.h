@@ -63,6 +63,8 @@ class Command {
     return std::any_cast<Asked>(&asked_);
   }
 
+  // Carries the request out. Blocks until it is done, or for --follow and --watch until the output
+  // is closed.
   ExitStatus run(const ToolStreams& streams) const { return run_(*this, streams); }
 
   CommonOptions options{};

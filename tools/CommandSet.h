@@ -42,6 +42,7 @@ class CommandSet {
 
   // Sets the heading under which the commands that are added next are listed.
   void beginGroup(const char* heading) { heading_ = heading; }
+  // Adds a command. The result lives as long as the parser; add the command's arguments to it.
   CLI::App& add(const CommandText& text);
   // Adds a sub-command: halvoxctl PARENT NAME.
   CLI::App& addBelow(CLI::App& parent, const CommandText& text);

@@ -23,6 +23,7 @@ struct PreferenceValue {
   platform::Value value;
 };
 
+// Whether a text that looks like TOML is taken as TOML.
 enum class ValueForm : unsigned char { kTomlOrString, kString };
 
 // Interprets what a user wrote as a value. Text that is one TOML value (7, true, "text", [1, 2],

@@ -76,6 +76,7 @@ struct Sleep {
   static constexpr const char* kCommand = "sleep";
   std::chrono::milliseconds time{};
 };
+// What one command line, or one line of a script, asks of the service.
 using Request = std::variant<Create, SetType, GetType, Configure, Start, Send, Stop, Destroy, Valid,
                              List, Kill, WaitForStart, Sleep>;
 

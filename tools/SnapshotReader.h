@@ -18,6 +18,7 @@ namespace halvox::tools {
 [[nodiscard]] platform::linux_::Result<std::map<std::string, std::string>> readSnapshotFiles(
     const std::filesystem::path& snapshot, const std::vector<std::string>& names);
 
+// What happens to files in the directory that have the name of one in the snapshot.
 enum class ExistingFiles : std::uint8_t { kRefuse, kReplace };
 
 // Unpacks a snapshot below `directory`, creates that directory if needed, and returns the names of

@@ -27,6 +27,7 @@ class Trace {
   [[nodiscard]] const std::string& name() const { return name_; }
   [[nodiscard]] bool isKernelTrace() const { return kind_ == Kind::kKernelTrace; }
 
+  // Adds a measurement, after those that were added before.
   void addTraceDataToCollect(std::unique_ptr<TraceInterval> interval);
   // Passes the events to every measurement, in the order in which the measurements were added.
   void processTracepoints(const TraceData::Session& session, const TraceData::Events& events);

@@ -37,6 +37,7 @@ class TraceData {
   [[nodiscard]] std::uint32_t getNumTimesTraced() const { return count_; }
 
  protected:
+  // The two are separate because a TracePoint adds results that do not count as traced.
   void addResult(std::uint64_t value) { results_.push_back(value); }
   void countOne() { ++count_; }
 

@@ -33,6 +33,7 @@ class TraceInterval : public TraceData {
   virtual void processTracepointsAnyThread(const Session& session, const Events& events);
 
  private:
+  // Adds the nanoseconds between two ticks of the trace's clock.
   void addInterval(const Session& session, std::uint64_t begin, std::uint64_t end);
 
   const TraceIntervalCodes codes_;

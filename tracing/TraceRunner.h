@@ -61,7 +61,9 @@ class TraceRunner {
   using Results = std::map<const Trace*, Trace::Results>;
   enum class State : std::uint8_t { kMade, kRecording, kFinished };
 
+  // Logs one line for each name, with the number of its values and their range.
   static void printTraceResults(const Results::value_type& entry);
+  // Writes the results of all traces to the results file and logs them. Waits for the disk.
   void writeScoresheet() const;
 
   State state_ = State::kMade;

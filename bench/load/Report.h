@@ -25,6 +25,7 @@ struct Measurement {
 std::string formatTable(const std::vector<Measurement>& measurements);
 std::string formatJson(const std::vector<Measurement>& measurements);
 
+// The value at that rank of the sorted values; 0 without values.
 double median(std::vector<double> values);
 double percentile(std::vector<double> values, double percent);
 

@@ -20,11 +20,18 @@ struct LoadOptions {
 
 // Each scenario starts its own servers, appends its measurements and ends the servers. Throws
 // std::runtime_error when a server cannot be started or reached.
+
+// Messages a second, and the CPU time of the service and of its client for each.
 void measureThroughput(const LoadOptions& options, std::vector<Measurement>& results);
+// The time to an answer, of a client alone and of one beside busy clients.
 void measureLatency(const LoadOptions& options, std::vector<Measurement>& results);
+// Resident memory of the service, and the growth for each message in a history.
 void measureMemory(const LoadOptions& options, std::vector<Measurement>& results);
+// Whether a message costs more with many sessions, many clients or a long history.
 void measureGrowth(const LoadOptions& options, std::vector<Measurement>& results);
+// Wake-ups of a service that has a client but no work.
 void measureIdle(const LoadOptions& options, std::vector<Measurement>& results);
+// The stop of a session with a long history: its time, its memory and the wait of another client.
 void measureStop(const LoadOptions& options, std::vector<Measurement>& results);
 
 }  // namespace halvox::bench

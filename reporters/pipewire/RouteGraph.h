@@ -37,6 +37,7 @@ class RouteGraph {
  public:
   // Do not add streams: a recorder that listens to a playback stream is not its device.
   void addDevice(GlobalID id, Route::Device device);
+  // No route contains the device from then on. An unknown ID is ignored.
   void removeDevice(GlobalID id);
   void addLink(GlobalID id, Link link);
   // Returns the nodes that the link connected; both are 0 if the link is unknown.
@@ -50,6 +51,7 @@ class RouteGraph {
   // The nodes at the other end, each with the number of links to it. Each channel has a link.
   using Peers = std::map<GlobalID, unsigned>;
   using PeerMap = std::unordered_map<GlobalID, Peers>;
+  // Removes one link from `from` to `peer`.
   static void release(PeerMap& map, GlobalID from, GlobalID peer);
 
   std::unordered_map<GlobalID, Route::Device> devices_;

@@ -17,8 +17,11 @@ class StreamListener {
   StreamListener(const StreamListener&) = delete;
   StreamListener& operator=(const StreamListener&) = delete;
 
+  // All properties, not only those that have changed.
   virtual void onStreamProperties(std::uint32_t id, const Properties& properties) = 0;
   virtual void onStreamState(std::uint32_t id, pw_node_state state) = 0;
+  // `value` belongs to the library and is valid until the call returns. It comes from another
+  // process.
   virtual void onStreamParam(std::uint32_t id, std::uint32_t param, const spa_pod* value) = 0;
 };
 

@@ -35,11 +35,16 @@ class StreamSession {
   StreamSession(const StreamSession&) = delete;
   StreamSession& operator=(const StreamSession&) = delete;
 
+  // The stream has these properties now. Sends those that have changed.
   void setProperties(const Properties& properties);
+  // Begins or ends a run. The first run starts the session.
   void setRunning(bool running);
+  // The stream has this format now; a format without any known value is ignored.
   void setFormat(const StreamFormat& format);
   // Ignores an empty route: a stream that is being moved has no device for a moment.
   void setRoute(const Route& route);
+  // Volume controls of the stream have changed. Sends the volume if it, or whether the stream
+  // plays, differs from the last message.
   void changeVolume(const VolumeChange& change);
   // The stream missed the cycle that began at `cycle` and lasted `lost`. A later reportXruns()
   // reports it.
@@ -52,10 +57,12 @@ class StreamSession {
   [[nodiscard]] Direction direction() const { return identity_.direction; }
 
  private:
+  // These send the messages with which a run begins and ends.
   void beginRun();
   void endRun();
   void sendFormat();
   void sendRoute();
+  // Sends nothing while no volume is known.
   void sendVolumeIfChanged();
   void sendXrun(XrunMeter::Seconds lost);
   void sendRun(EventType type);

@@ -56,11 +56,16 @@ class StreamTracker {
   // state again.
   void serviceRestarted();
 
+  // A node exists: a stream gets a session, a device is remembered for routes. Replaces a stream
+  // that has this ID.
   void nodeAdded(const Node& node);
+  // Ends the session of a stream. Any object may be named.
   void nodeRemoved(GlobalID id);
+  // A link connects two nodes, or is removed. Both update the routes of their streams.
   void linkAdded(GlobalID id, Link link);
   void linkRemoved(GlobalID id);
 
+  // Changes of one stream; see StreamSession for what each of them sends.
   void streamPropertiesChanged(GlobalID id, const Properties& properties);
   void streamRunningChanged(GlobalID id, bool running);
   void streamFormatChanged(GlobalID id, const StreamFormat& format);
