@@ -74,6 +74,7 @@ void roundFraction(std::string& decimal, std::size_t point, std::size_t digits) 
 }
 
 std::string formatBucket(const Value& bucket, std::uint64_t fractionDigits) {
+  // Infinities and NaN have no decimal digits to round.
   if (!std::isfinite(bucket.toDouble())) return platform::describe(bucket);
   std::string decimal = plainDecimal(bucket);
   const std::size_t point = decimal.find('.');

@@ -14,6 +14,7 @@ constexpr std::uint32_t kFirstWithHighHalf = 0x00010000;
 // All bits set is the category of the summary event, which has no domain.
 constexpr std::uint32_t kLastWithHighHalf = 0xFFFFFFFE;
 
+// In these tables the position of a name is the number that clients send and that is stored.
 constexpr std::array<std::string_view, 16> kCategoryNames = {
     "Undefined",         "Generic",     "Record", "Input",         "Playback",    "Output",
     "PlaybackAndRecord", "IO",          "Setup",  "ClientRequest", "RouteChange", "Error",
@@ -78,6 +79,8 @@ std::string_view domainText(AudioEventCategory domain) {
 HVReportingCategoryText HVReportingUtilityCategoryTextParts(AudioEventCategory category) {
   const auto value = static_cast<std::uint32_t>(category);
   const std::uint32_t low = value & kLowHalf;
+  // The "_" of a category whose high half is not exactly one domain is required: it shows that
+  // there was something.
   return {hasHighHalf(category) ? domainText(static_cast<AudioEventCategory>(value & kHighHalf))
                                 : std::string_view{},
           kCategoryNames[low < kCategoryNames.size() ? low : 0]};

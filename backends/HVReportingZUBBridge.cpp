@@ -40,6 +40,7 @@ std::int64_t leadingInteger(std::string_view text) {
   using Limits = std::numeric_limits<std::int64_t>;
   text.remove_prefix(std::min(text.find_first_not_of(" \t"), text.size()));
   const bool negative = text.starts_with('-');
+  // from_chars() does not accept a plus sign.
   if (text.starts_with('+') && !text.starts_with("+-")) text.remove_prefix(1);
   std::int64_t integer = 0;
   const auto [end, failure] = std::from_chars(text.begin(), text.end(), integer);

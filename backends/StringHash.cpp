@@ -20,6 +20,7 @@ constexpr std::size_t kBlock = 64;
 template <typename Word>
 Word wordAt(std::string_view text, std::size_t offset) {
   Word word;
+  // The offset need not be aligned.
   std::memcpy(&word, text.data() + offset, sizeof word);
   return word;
 }

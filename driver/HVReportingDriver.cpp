@@ -5,6 +5,7 @@
 namespace halvox {
 namespace {
 
+// The names outlive the views that they are made from.
 std::optional<std::string> copy(std::optional<std::string_view> name) {
   if (!name.has_value()) return std::nullopt;
   return std::string(*name);

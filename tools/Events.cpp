@@ -13,6 +13,7 @@ using platform::linux_::StoreReader;
 
 std::string formatEvent(const StoredEvent& event, OutputForm form) {
   if (form == OutputForm::kText) {
+    // Names and payloads come from clients, which could otherwise control the terminal.
     return localTime(event.time) + "  " + harmlessText(event.name) + "  " +
            fieldsOfJson(event.payload);
   }

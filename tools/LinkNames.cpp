@@ -42,6 +42,7 @@ std::string tagOf(const StoredRecord& message) {
 // domain without a name, or nothing.
 std::string domainOf(Category category) {
   const std::string name = client::categoryName(category);
+  // The name of a category is that of its domain followed by that of its low half.
   return name.substr(0, name.size() - client::categoryName(category & kCategoryProper).size());
 }
 

@@ -28,7 +28,8 @@ using platform::Value;
 
 constexpr const char* kSignatureName = "signature.json";
 constexpr const char* kManifestName = "manifest.json";
-// Limits the width, so that one long name does not fill all lines with blanks.
+// Limits the width, so that one long name does not fill all lines with blanks. An archive of 200 KB
+// with one such name printed 400 MB of blanks.
 constexpr std::size_t kWidestColumn = 40;
 
 // Returns the archive that an argument means, or the exit status if there is none.

@@ -33,6 +33,7 @@ constexpr std::size_t kBlock = 64U << 10U;
 // Above what this program writes, which is 64 MiB before compression by default.
 constexpr std::uint64_t kMostBytes = 256U << 20U;
 constexpr std::size_t kMostEntries = 10'000;
+// Only the signature and the manifest are read as text.
 constexpr std::size_t kMostBytesOfText = 16U << 20U;
 constexpr const char* kTooLarge = "the archive is too large when unpacked";
 // libarchive's code for a file of another format. Its system text ("Invalid or incomplete multibyte
@@ -207,6 +208,8 @@ Result<std::vector<std::string>> unpack(const fs::path& source, const fs::path& 
   const WorkingDirectory inside(directory);
   if (inside.error() != 0) return failed(directory, errnoText(inside.error()));
   if (Result<void> done = check(source, directory, existing); !done) return std::move(done).error();
+  // The names have been checked already. These options also refuse a symbolic link in the
+  // directory.
   const DiskWriter disk(archive_write_disk_new());
   archive_write_disk_set_options(disk.get(), ARCHIVE_EXTRACT_SECURE_SYMLINKS |
                                                  ARCHIVE_EXTRACT_SECURE_NODOTDOT |

@@ -16,6 +16,7 @@ void Trace::processTracepoints(const TraceData::Session& session, const TraceDat
 Trace::Results Trace::getResults() {
   for (const auto& measurement : measurements_) {
     for (const std::uint64_t value : measurement->getResults()) {
+      // A multimap keeps equal names in the order of insertion, which is that of the measurements.
       results_.emplace(measurement->name(), value);
     }
   }

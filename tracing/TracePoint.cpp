@@ -13,6 +13,7 @@ void TracePoint::processTracepoints(const Session& /*session*/, const Events& ev
   if (argumentIndex_ < 1 || argumentIndex_ > static_cast<std::int32_t>(kArguments.size())) return;
   const Argument argument = kArguments[static_cast<std::size_t>(argumentIndex_ - 1)];
   for (const platform::trace_point& event : events) {
+    // The count of traced events stays as it is; this is required.
     if (event.debugid == code_) addResult(event.*argument);
   }
 }

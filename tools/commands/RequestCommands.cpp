@@ -60,6 +60,7 @@ void addJson(CommandSet& commands, CLI::App& app, const SharedArguments& argumen
 // Adds a request with a session's reporter ID as its only argument.
 template <typename R>
 void addForSession(CommandSet& commands, const CommandText& text) {
+  // Shared with the callbacks of the parser, which outlive this function.
   const auto arguments = std::make_shared<Arguments>();
   CLI::App& app = commands.add(text);
   addID(app, arguments);
@@ -113,6 +114,7 @@ void addStart(CommandSet& commands) {
 }
 
 Send makeSend(const Arguments& given) {
+  // Neither is assumed: the command cannot know which sessions are meant.
   if (given.isToAll == !given.ids.empty()) {
     throw CLI::ValidationError(
         "--id",

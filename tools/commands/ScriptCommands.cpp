@@ -37,6 +37,7 @@ ExitStatus runFile(const RunScript& script, const CommonOptions& options,
 
 ExitStatus runTypedLines(const RunShell& /*shell*/, const CommonOptions& options,
                          const ToolStreams& streams) {
+  // Continues after errors, because a person at the terminal can correct a line.
   return runScript({streams.input, "line", streams.isInputTerminal, true}, options, streams.output,
                    streams.errors);
 }

@@ -11,6 +11,7 @@ namespace halvox::tools {
 namespace {
 
 Parsed<double> parseTimeNow(std::string_view text) {
+  // The store has times of the wall clock.
   const auto now = std::chrono::system_clock::now().time_since_epoch();
   return parseTime(text, std::chrono::duration<double>(now).count());
 }

@@ -20,6 +20,7 @@ Preferences checked(const Preferences& request) {
   if (request.action != Action::kGet && !request.key.has_value()) {
     throw CLI::ValidationError("KEY", "is missing; expected the key to change");
   }
+  // Checked here and not by the parser, which knows one form of arguments for all three actions.
   if ((request.action == Action::kSet) != request.value.has_value()) {
     throw CLI::ValidationError("VALUE", request.value.has_value()
                                             ? "is only for set"
