@@ -80,7 +80,7 @@ int run(std::span<const char* const> arguments) {
 }  // namespace
 
 int main(int argc, char** argv) {
-  // When the reader of a pipe has gone or a file has reached its size limit, the write fails and is
+  // When the reader of a pipe has closed it or a file is at its size limit, the write fails and is
   // counted. By default these signals would end the process instead.
   std::signal(SIGPIPE, SIG_IGN);
   std::signal(SIGXFSZ, SIG_IGN);

@@ -116,7 +116,7 @@ void SessionLink::start(const Owner& owner, const LinkStart& atStart) {
   const auto opened = framework.TLMReportingCreateSession(
       atStart.sessionInfo(profile_.reporterID(), *token), atStart.userInfo());
   tlmReportingSession_.set(opened);
-  // Weak: the framework may never answer. If the session is gone by then, the answer is only
+  // Weak: the framework may never answer. If the session no longer exists then, the answer is only
   // logged.
   const auto discovery = std::make_shared<LinkDiscovery>(
       [weakLink = std::weak_ptr(heldBy(owner))](const LinkDiscovery::Backends& backends) {

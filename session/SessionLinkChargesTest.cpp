@@ -58,7 +58,7 @@ TEST_F(SessionLinkChargesTest, MessagesOfTheSessionItselfAreChargedToItsOwner) {
   start();
   send({{"a", 1}});
 
-  session_->stop();  // the summary and the stop job wait now; the history is gone
+  session_->stop();  // the summary and the stop job wait now; the history has been freed
   EXPECT_GT(owner_->use().bytes, 0U);
   framework_.answerDiscovery(kServers);
   run();

@@ -172,7 +172,7 @@ class DriverPrinter {
     using Clock = std::chrono::steady_clock;
     auto before = sample();
     auto time = Clock::now();
-    // poll() notices during the pause that the reader is gone. A write would notice it only after
+    // poll() notices during the pause that the pipe was closed. A write would notice it only after
     // the pause.
     while (out_ && isReadFor(interval, outputDescriptor)) {
       auto now = sample();

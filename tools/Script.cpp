@@ -115,8 +115,7 @@ ExitStatus runScript(const ScriptSource& source, const CommonOptions& options, s
   std::string line;
   for (std::size_t number = 1;; ++number) {
     if (source.isPrompting) out << "halvox> ";
-    // The answers of a line are visible before the next one is read, which may take a while on a
-    // pipe.
+    // Show the answers of a line before the next line is read: on a pipe that may take long.
     out << std::flush;
     if (!std::getline(source.lines, line)) break;
 

@@ -82,7 +82,7 @@ class Walk {
     if (result != ARCHIVE_OK) return failed(snapshot_, textOf(reader_.get()));
     if (++entries_ > kMostEntries) return failed(snapshot_, "the archive has too many files");
     // Skipping an entry decompresses it too. Test the sizes in the headers before that.
-    // Bounded, so that a size of nearly 2^64 cannot make the sum wrap.
+    // Each is bounded, so that a size of nearly 2^64 cannot make the sum wrap.
     announced_ += std::min(static_cast<std::uint64_t>(archive_entry_size(entry)), kMostBytes + 1);
     if (announced_ > kMostBytes) return failed(snapshot_, kTooLarge);
     const char* name = archive_entry_pathname(entry);

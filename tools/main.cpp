@@ -8,7 +8,7 @@
 #include "tools/Tool.h"
 
 int main(int argc, char** argv) {
-  // End quietly when the reader of the output is gone, even if our parent made us ignore SIGPIPE.
+  // End quietly when the reader closes the output, even if our parent made us ignore SIGPIPE.
   std::signal(SIGPIPE, SIG_DFL);
   // This program does not mix streams with stdio, so they need not be synchronised.
   std::ios::sync_with_stdio(false);

@@ -50,7 +50,7 @@ class StreamTracker {
 
   // A server is connected. Its objects follow as events.
   void serverConnected(std::uint32_t cookie);
-  // The server and all its objects are gone. Ends all sessions.
+  // The server has disconnected, and all its objects with it. Ends all sessions.
   void serverLost();
   // The reporting service restarted and lost its history. Each started session sends its current
   // state again.

@@ -14,7 +14,7 @@ namespace halvox::pipewire_reporter {
 // Follows the nodes, links and clients of a PipeWire server and passes their changes to a
 // StreamTracker.
 //
-//   waiting ──connected──► watching ──server gone──► waiting (all streams gone)
+//   waiting ──connected──► watching ──disconnected──► waiting (without streams)
 //
 // Without a server it tries to connect after 0.1 s, then after twice as long each time, up to 5 s.
 // Belongs to the loop thread. Does not own the loop and the tracker, which must outlive it. An

@@ -211,7 +211,7 @@ class Service:
         for line in Path(f"/proc/{self.process.pid}/status").read_text().splitlines():
             if line.startswith("VmRSS:"):
                 return int(line.split()[1])
-        raise AssertionError("the service is gone")
+        raise AssertionError("the service has ended")
 
     def threads(self):
         return len(os.listdir(f"/proc/{self.process.pid}/task"))
