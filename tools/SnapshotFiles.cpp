@@ -25,6 +25,8 @@ namespace fs = std::filesystem;
 
 using platform::Dictionary;
 using platform::Value;
+using platform::linux_::Failure;
+using platform::linux_::Result;
 
 constexpr const char* kSignatureName = "signature.json";
 constexpr const char* kManifestName = "manifest.json";
@@ -66,18 +68,20 @@ struct Contents {
 };
 
 // Returns the signature and manifest of a snapshot, or an error.
-std::variant<Contents, std::string> readContents(const fs::path& file) {
+Result<Contents> readContents(const fs::path& file) {
   auto read = readSnapshotFiles(file, {kSignatureName, kManifestName});
-  if (!read) return std::move(read).error().message;
+  if (!read) return std::move(read).error();
   const std::map<std::string, std::string>& texts = *read;
   Contents contents;
   for (const auto& [name, target] : {std::pair(kSignatureName, &contents.signature),
                                      std::pair(kManifestName, &contents.manifest)}) {
     const auto text = texts.find(name);
-    if (text == texts.end()) return file.native() + ": not a snapshot: it has no " + name;
+    if (text == texts.end()) {
+      return Failure<>{file.native() + ": not a snapshot: it has no " + name};
+    }
     auto parsed = parseDictionary(text->second);
     if (auto* error = std::get_if<ArgumentError>(&parsed)) {
-      return file.native() + ": " + name + " in it: " + error->message;
+      return Failure<>{file.native() + ": " + name + " in it: " + error->message};
     }
     *target = std::get<Dictionary>(std::move(parsed));
   }
@@ -154,18 +158,15 @@ ExitStatus showSnapshot(const ShowSnapshot& request, OutputForm form, std::ostre
   const auto found = findSnapshot(request.file, complain);
   if (const auto* status = std::get_if<ExitStatus>(&found)) return *status;
   const auto& file = std::get<fs::path>(found);
-  const auto read = readContents(file);
-  if (const auto* error = std::get_if<std::string>(&read)) {
-    return complain(ExitStatus::kBadArguments, *error);
-  }
-  const auto& contents = std::get<Contents>(read);
+  const auto contents = readContents(file);
+  if (!contents) return complain(ExitStatus::kBadArguments, contents.error().message);
   if (form == OutputForm::kJson) {
     out << harmlessJson(toJson(Dictionary{{"file", file.native()},
-                                          {"signature", contents.signature},
-                                          {"manifest", contents.manifest}}))
+                                          {"signature", contents->signature},
+                                          {"manifest", contents->manifest}}))
         << '\n';
   } else {
-    printText(file, contents, out);
+    printText(file, *contents, out);
   }
   return ExitStatus::kDone;
 }

@@ -88,10 +88,13 @@ bool read(const std::string& file, const SummaryMessageHandler& handler, Session
           const Complaint& complain) {
   session.file = file;
   session.name = parseSummaryName(fs::path(file).filename().string()).value_or(SummaryName{});
-  std::string error;
-  if (readSummary(file, handler, session.totals, error)) return true;
-  complain(ExitStatus::kBadArguments, file + ": " + error);
-  return false;
+  const auto totals = readSummary(file, handler);
+  if (totals) {
+    session.totals = *totals;
+  } else {
+    complain(ExitStatus::kBadArguments, file + ": " + totals.error().message);
+  }
+  return totals.has_value();
 }
 
 // Reads the file twice: the table comes before the messages and needs all of them.

@@ -21,6 +21,10 @@
 namespace halvox::tools {
 namespace {
 
+using platform::linux_::errnoText;
+using platform::linux_::Failure;
+using platform::linux_::Result;
+
 constexpr std::string_view kTimePattern = "dddddddd-ddddddsdddd";
 constexpr std::string_view kMark = "-halvox-";
 constexpr std::string_view kEnding = ".json";
@@ -193,18 +197,12 @@ struct CloseFile {
 using File = std::unique_ptr<std::FILE, CloseFile>;
 
 // Opens a regular file. Fails for directories and pipes: reading those may never end.
-File openFile(const std::string& path, std::string& error) {
+Result<File> openFile(const std::string& path) {
   struct stat status {};
-  if (::stat(path.c_str(), &status) != 0) {
-    error = platform::linux_::errnoText(errno);
-    return nullptr;
-  }
-  if (!S_ISREG(status.st_mode)) {
-    error = "is not a file";
-    return nullptr;
-  }
+  if (::stat(path.c_str(), &status) != 0) return Failure<>{errnoText(errno)};
+  if (!S_ISREG(status.st_mode)) return Failure<>{"is not a file"};
   File file(std::fopen(path.c_str(), "rbe"));
-  if (file == nullptr) error = platform::linux_::errnoText(errno);
+  if (file == nullptr) return Failure<>{errnoText(errno)};
   return file;
 }
 
@@ -226,31 +224,28 @@ std::optional<SummaryName> parseSummaryName(std::string_view name) {
   return parsed;
 }
 
-bool readSummary(const std::string& path, const SummaryMessageHandler& handler,
-                 SummaryTotals& totals, std::string& error) {
+Result<SummaryTotals> readSummary(const std::string& path, const SummaryMessageHandler& handler) {
   // Numbers as texts keep the digits that the service wrote. Iterative, because a file may be
   // nested deeper than the stack allows.
   constexpr unsigned kFlags = rapidjson::kParseNumbersAsStringsFlag |
                               rapidjson::kParseIterativeFlag |
                               rapidjson::kParseValidateEncodingFlag;
-  const File file = openFile(path, error);
-  if (file == nullptr) return false;
+  const Result<File> opened = openFile(path);
+  if (!opened) return opened.error();
+  std::FILE* const file = opened->get();
   std::vector<char> buffer(kBufferBytes);
-  rapidjson::FileReadStream stream(file.get(), buffer.data(), buffer.size());
+  rapidjson::FileReadStream stream(file, buffer.data(), buffer.size());
+  SummaryTotals totals;
   SummaryHandler summary(handler, totals);
   rapidjson::Reader reader;
   const rapidjson::ParseResult result = reader.Parse<kFlags>(stream, summary);
   // Before the parser's result: to the parser a read error looks like the end of the file.
-  if (std::ferror(file.get()) != 0) {
-    error = "cannot be read";
-    return false;
-  }
-  if (!result.IsError()) return true;
+  if (std::ferror(file) != 0) return Failure<>{"cannot be read"};
+  if (!result.IsError()) return totals;
   // Opened again, because the place of an error is counted from the beginning.
   std::ifstream text(path, std::ios::binary);
-  error = "is not a summary: " +
-          describeJsonError(text, result.Offset(), result.Code(), summary.problem());
-  return false;
+  return Failure<>{"is not a summary: " +
+                   describeJsonError(text, result.Offset(), result.Code(), summary.problem())};
 }
 
 }  // namespace halvox::tools

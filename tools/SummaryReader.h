@@ -6,6 +6,8 @@
 #include <string>
 #include <string_view>
 
+#include "platform/linux/base/Result.h"
+
 namespace halvox::tools {
 
 // The parts of the name of a summary file.
@@ -33,10 +35,10 @@ struct SummaryTotals {
 using SummaryMessageHandler =
     std::function<void(std::string_view identifier, std::string_view message)>;
 
-// Reads a summary; holds at most one message in memory. Returns false with the reason in `error` if
-// the file cannot be read or is not a summary. The messages before the error were passed to
+// Reads a summary; holds at most one message in memory. Fails if the file cannot be read or is not
+// a summary; the message does not name the file. The messages before the error were passed to
 // `handler`.
-bool readSummary(const std::string& path, const SummaryMessageHandler& handler,
-                 SummaryTotals& totals, std::string& error);
+platform::linux_::Result<SummaryTotals> readSummary(const std::string& path,
+                                                    const SummaryMessageHandler& handler);
 
 }  // namespace halvox::tools

@@ -48,10 +48,9 @@ class SummaryTest : public testing::Test {
   }
   // What is wrong with a file of that text.
   std::string problemOf(const std::string& text) {
-    SummaryTotals totals;
-    std::string error;
-    EXPECT_FALSE(readSummary(write("broken.json", text), nullptr, totals, error)) << text;
-    return error;
+    const auto read = readSummary(write("broken.json", text), nullptr);
+    EXPECT_FALSE(read) << text;
+    return read ? "" : read.error().message;
   }
 
   static constexpr const char* kStore =

@@ -16,9 +16,11 @@
 namespace halvox::tools {
 namespace {
 
+using platform::linux_::errnoText;
+using platform::linux_::Failure;
+using platform::linux_::Result;
 using Writer = rapidjson::Writer<rapidjson::OStreamWrapper>;
 
-constexpr const char* kNoResults = "is not a results file of a trace";
 constexpr double kNanosecondsPerMicrosecond = 1000;
 constexpr int kProcess = 1;
 
@@ -64,33 +66,37 @@ void writeInterval(Writer& json, int track, const std::string& name, double star
   json.EndObject();
 }
 
+Failure<> notResults(const std::string& file) {
+  return {file + ": is not a results file of a trace"};
+}
+
 }  // namespace
 
-std::variant<TraceResults, std::string> readTraceResults(const std::string& file) {
+Result<TraceResults> readTraceResults(const std::string& file) {
   std::ifstream stream(file);
   // A directory opens but cannot be read.
   if (stream) static_cast<void>(stream.peek());
-  if (stream.bad() || !stream.is_open()) return platform::linux_::errnoText(errno);
+  if (stream.bad() || !stream.is_open()) return Failure<>{file + ": " + errnoText(errno)};
   rapidjson::IStreamWrapper input(stream);
   rapidjson::Document document;
   constexpr unsigned kFlags = rapidjson::kParseFullPrecisionFlag |
                               rapidjson::kParseValidateEncodingFlag |
                               rapidjson::kParseIterativeFlag;
   document.ParseStream<kFlags>(input);
-  if (document.HasParseError() || !document.IsObject()) return std::string(kNoResults);
+  if (document.HasParseError() || !document.IsObject()) return notResults(file);
   const auto has = [&](const char* name) { return document.HasMember(name); };
   // Another file of JSON must not pass for results: all that the service writes is required.
   if (!has("product") || !document["product"].IsString() || !has("unit") ||
       !document["unit"].IsString() || textOf(document["unit"]) != "ns" || !has("values") ||
       !document["values"].IsObject()) {
-    return std::string(kNoResults);
+    return notResults(file);
   }
   TraceResults results{.product = textOf(document["product"])};
   const rapidjson::Value& values = document["values"];
   const auto members = values.MemberBegin();
   for (rapidjson::SizeType index = 0; index < values.MemberCount(); ++index) {
     const auto& member = members[static_cast<std::ptrdiff_t>(index)];
-    if (!member.value.IsArray()) return std::string(kNoResults);
+    if (!member.value.IsArray()) return notResults(file);
     auto& numbers = results.values.emplace_back(textOf(member.name), std::vector<double>()).second;
     for (const auto& value : member.value.GetArray()) {
       if (value.IsNumber()) numbers.push_back(value.GetDouble());

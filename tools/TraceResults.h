@@ -3,8 +3,9 @@
 #include <ostream>
 #include <string>
 #include <utility>
-#include <variant>
 #include <vector>
+
+#include "platform/linux/base/Result.h"
 
 namespace halvox::tools {
 
@@ -24,7 +25,7 @@ struct TraceStatistics {
 };
 
 // Returns the results, or what is wrong with the file.
-std::variant<TraceResults, std::string> readTraceResults(const std::string& file);
+platform::linux_::Result<TraceResults> readTraceResults(const std::string& file);
 
 // `values` must not be empty.
 TraceStatistics statisticsOf(std::vector<double> values);

@@ -224,19 +224,16 @@ void print(const TraceResults& results, OutputForm form, std::ostream& out) {
 // Prints what was measured with these parameters, or reports that nothing was.
 ExitStatus showMeasured(const std::string& file, const std::string& params, OutputForm form,
                         std::ostream& out, const Complaint& complain) {
-  const auto read = readTraceResults(file);
-  if (const auto* error = std::get_if<std::string>(&read)) {
-    return complain(ExitStatus::kBadArguments, file + ": " + *error);
-  }
-  const auto& results = std::get<TraceResults>(read);
+  const auto results = readTraceResults(file);
+  if (!results) return complain(ExitStatus::kBadArguments, results.error().message);
   const auto isEmpty = [](const auto& entry) { return entry.second.empty(); };
-  if (std::ranges::all_of(results.values, isEmpty)) {
+  if (std::ranges::all_of(results->values, isEmpty)) {
     return complain(ExitStatus::kRefused,
                     "nothing was measured: either no program emitted both codes of an interval, or "
                     "the service could not record or could not read " +
                         params + "; the service's log says which");
   }
-  print(results, form, out);
+  print(*results, form, out);
   return ExitStatus::kDone;
 }
 
@@ -308,10 +305,8 @@ ExitStatus showTrace(const ShowTrace& request, OutputForm form, std::ostream& ou
                      std::ostream& errors) {
   const Complaint complain("trace show", form, out, errors);
   const auto read = readTraceResults(request.file);
-  if (const auto* error = std::get_if<std::string>(&read)) {
-    return complain(ExitStatus::kBadArguments, request.file + ": " + *error);
-  }
-  print(std::get<TraceResults>(read), form, out);
+  if (!read) return complain(ExitStatus::kBadArguments, read.error().message);
+  print(*read, form, out);
   return ExitStatus::kDone;
 }
 
@@ -319,11 +314,9 @@ ExitStatus exportTrace(const ExportTrace& request, OutputForm form, std::ostream
                        std::ostream& errors) {
   const Complaint complain("trace export", form, out, errors);
   const auto read = readTraceResults(request.file);
-  if (const auto* error = std::get_if<std::string>(&read)) {
-    return complain(ExitStatus::kBadArguments, request.file + ": " + *error);
-  }
+  if (!read) return complain(ExitStatus::kBadArguments, read.error().message);
   std::ofstream file(request.to);
-  if (file) writeTraceEvents(std::get<TraceResults>(read), file);
+  if (file) writeTraceEvents(*read, file);
   file.close();
   if (file) return ExitStatus::kDone;
   return complain(ExitStatus::kCannotWrite, request.to + ": " + platform::linux_::errnoText(errno));
