@@ -48,9 +48,9 @@ lttng_domain domain() {
 }
 
 // `result` is a code of the library; negative ones are errors.
-LttngControl::Failure check(int result, std::string_view what) {
-  if (result >= 0) return std::nullopt;
-  return "cannot " + std::string(what) + ": " + ::lttng_strerror(result);
+Result<void> check(int result, std::string_view what) {
+  if (result >= 0) return {};
+  return Failure<>{"cannot " + std::string(what) + ": " + ::lttng_strerror(result)};
 }
 
 void copyName(std::span<char> to, std::string_view from) {
@@ -59,10 +59,10 @@ void copyName(std::span<char> to, std::string_view from) {
   to[length] = '\0';
 }
 
-LttngControl::Failure addChannel(lttng_handle* handle) {
+Result<void> addChannel(lttng_handle* handle) {
   lttng_domain ust = domain();
   const Channel channel(::lttng_channel_create(&ust));
-  if (!channel) return "cannot create a channel";
+  if (!channel) return Failure<>{"cannot create a channel"};
   copyName(channel.get()->name, kChannel);
   // When the buffers are full, new events are lost and counted. Overwriting old ones would lose the
   // begins of intervals without a count.
@@ -72,20 +72,20 @@ LttngControl::Failure addChannel(lttng_handle* handle) {
   return check(::lttng_enable_channel(handle, channel.get()), "enable the channel");
 }
 
-LttngControl::Failure addContexts(lttng_handle* handle) {
+Result<void> addContexts(lttng_handle* handle) {
   for (const auto context :
        {LTTNG_EVENT_CONTEXT_VPID, LTTNG_EVENT_CONTEXT_VTID, LTTNG_EVENT_CONTEXT_PROCNAME}) {
-    lttng_event_context added{};
-    added.ctx = context;
-    const int result = ::lttng_add_context(handle, &added, nullptr, kChannel);
-    if (auto failure = check(result, "add a context")) return failure;
+    lttng_event_context wanted{};
+    wanted.ctx = context;
+    const int result = ::lttng_add_context(handle, &wanted, nullptr, kChannel);
+    if (auto added = check(result, "add a context"); !added) return added;
   }
-  return std::nullopt;
+  return {};
 }
 
-LttngControl::Failure addEvent(lttng_handle* handle, RecordingPlan plan) {
+Result<void> addEvent(lttng_handle* handle, RecordingPlan plan) {
   const Event event(::lttng_event_create());
-  if (!event) return "cannot create an event";
+  if (!event) return Failure<>{"cannot create an event"};
   event.get()->type = LTTNG_EVENT_TRACEPOINT;
   event.get()->loglevel_type = LTTNG_EVENT_LOGLEVEL_ALL;
   copyName(event.get()->name, plan.event);
@@ -126,54 +126,60 @@ void LttngControl::removeLeftovers() {
   std::filesystem::remove_all(scratchDirectory_, ignored);
 }
 
-LttngControl::Failure LttngControl::begin(const RecordingPlan& plan, Recording& recording) {
+Result<LttngControl::Recording> LttngControl::begin(const RecordingPlan& plan) {
   const MutexLock lock(mutex_);
-  std::error_code error;
-  std::filesystem::create_directories(tracesDirectory_, error);
+  std::error_code ignored;
+  std::filesystem::create_directories(tracesDirectory_, ignored);
+  Recording recording;
   // The process ID tells these recordings from those that an earlier service left.
   recording.name = namePrefix() + std::to_string(::getpid()) + "-" + std::to_string(++begun_);
   recording.directory = scratchDirectory_ / recording.name;
+  if (auto isSetUp = setUp(plan, recording); !isSetUp) {
+    discard(recording);
+    return std::move(isSetUp).error();
+  }
+  // For tests and tools that wait for it. The recording works without it, so errors are ignored.
+  std::filesystem::create_directories(recordingDirectory_, ignored);
+  std::ofstream(recordingDirectory_ / recording.name).close();
+  return recording;
+}
+
+Result<void> LttngControl::setUp(const RecordingPlan& plan, const Recording& recording) {
+  std::error_code error;
   std::filesystem::create_directories(recording.directory, error);
-  if (error) return "cannot create " + recording.directory.string() + ": " + error.message();
+  if (error) {
+    return Failure<>{"cannot create " + recording.directory.string() + ": " + error.message()};
+  }
   // Asked at each recording: a daemon that others started is used, and it may end between two
   // traces.
   if (::lttng_session_daemon_alive() != 1) {
-    if (auto failure = daemon_.start(namePrefix())) return failure;
+    if (auto started = daemon_.start(namePrefix()); !started) return started;
   }
-  if (auto failure = setUp(plan, recording)) return failure;
-  // For tests and tools that wait for it. The recording works without it, so errors are ignored.
-  std::filesystem::create_directories(recordingDirectory_, error);
-  std::ofstream(recordingDirectory_ / recording.name).close();
-  return std::nullopt;
-}
-
-LttngControl::Failure LttngControl::setUp(const RecordingPlan& plan, const Recording& recording) {
   const std::string url = "file://" + recording.directory.string();
   const char* const name = recording.name.c_str();
-  if (auto failure = check(::lttng_create_session(name, url.c_str()), "create a session")) {
-    return failure;
-  }
+  auto done = check(::lttng_create_session(name, url.c_str()), "create a session");
+  if (!done) return done;
   lttng_domain ust = domain();
   const Handle handle(::lttng_create_handle(name, &ust));
-  Failure failure = handle ? addChannel(handle.get()) : Failure("cannot create a handle");
-  if (!failure) failure = addContexts(handle.get());
-  if (!failure) failure = addEvent(handle.get(), plan);
-  if (!failure) failure = check(::lttng_start_tracing(name), "start the session");
+  done = handle ? addChannel(handle.get()) : Failure<>{"cannot create a handle"};
+  if (done) done = addContexts(handle.get());
+  if (done) done = addEvent(handle.get(), plan);
+  if (done) done = check(::lttng_start_tracing(name), "start the session");
   // Nothing was recorded whose end would have to be awaited.
-  if (failure) static_cast<void>(::lttng_destroy_session_no_wait(name));
-  return failure;
+  if (!done) static_cast<void>(::lttng_destroy_session_no_wait(name));
+  return done;
 }
 
-LttngControl::Failure LttngControl::end(const Recording& recording) {
+Result<void> LttngControl::end(const Recording& recording) {
   const MutexLock lock(mutex_);
   std::error_code ignored;
   // First: the file promises that events are recorded.
   std::filesystem::remove(recordingDirectory_ / recording.name, ignored);
   const char* const name = recording.name.c_str();
   // Both calls wait until the recording is on the disk. Both are made whatever the first returns.
-  Failure failure = check(::lttng_stop_tracing(name), "stop the session");
-  Failure other = check(::lttng_destroy_session(name), "destroy the session");
-  return failure ? failure : other;
+  auto stopped = check(::lttng_stop_tracing(name), "stop the session");
+  auto destroyed = check(::lttng_destroy_session(name), "destroy the session");
+  return stopped ? destroyed : stopped;
 }
 
 void LttngControl::discard(const Recording& recording) {

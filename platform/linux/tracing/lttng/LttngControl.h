@@ -2,12 +2,12 @@
 
 #include <cstdint>
 #include <filesystem>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
 
 #include "platform/linux/base/Mutex.h"
+#include "platform/linux/base/Result.h"
 #include "platform/linux/tracing/lttng/SessionDaemon.h"
 
 namespace halvox::platform::linux_ {
@@ -39,7 +39,6 @@ struct RecordingPlan {
 // Failure: a text for the log. The platform's trace services own this object.
 class LttngControl {
  public:
-  using Failure = std::optional<std::string>;
   struct Recording {
     std::string name{};
     std::filesystem::path directory{};
@@ -52,10 +51,11 @@ class LttngControl {
 
   // Destroys what an earlier service left, and takes over its daemon. Cheap if nothing was left.
   void removeLeftovers();
-  // Begins to record. Starts a session daemon if none answers, which takes up to ten seconds.
-  [[nodiscard]] Failure begin(const RecordingPlan& plan, Recording& recording);
+  // Begins to record. Starts a session daemon if none answers, which takes up to ten seconds. On
+  // failure deletes the recording's files.
+  Result<Recording> begin(const RecordingPlan& plan);
   // Stops and destroys the LTTng session. When it returns, the recording is complete on the disk.
-  [[nodiscard]] Failure end(const Recording& recording);
+  Result<void> end(const Recording& recording);
   // Deletes the files of a recording.
   void discard(const Recording& recording);
   // Destroys all our sessions. Ends the daemon if we started it and nobody else uses it.
@@ -65,8 +65,7 @@ class LttngControl {
 
  private:
   [[nodiscard]] std::string namePrefix() const;
-  [[nodiscard]] Failure setUp(const RecordingPlan& plan, const Recording& recording)
-      HALVOX_REQUIRES(mutex_);
+  Result<void> setUp(const RecordingPlan& plan, const Recording& recording) HALVOX_REQUIRES(mutex_);
 
   const std::filesystem::path tracesDirectory_;
   const std::filesystem::path scratchDirectory_;

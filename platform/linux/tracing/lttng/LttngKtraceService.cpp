@@ -179,15 +179,13 @@ int LttngKtraceService::ktrace_start(const Session& session, std::shared_ptr<Dis
   // LTTng records every event if the filter is empty, so a session without ranges is not given to
   // it.
   if (ours->ranges.empty()) return 0;
-  LttngControl::Recording recording;
-  const RecordingPlan plan{.event = "halvox:kdebug", .filter = ours->filter()};
-  if (const auto failure = control_.begin(plan, recording)) {
+  auto begun = control_.begin({.event = "halvox:kdebug", .filter = ours->filter()});
+  if (!begun) {
     failed_.add();
-    control_.discard(recording);
-    kLog.error("cannot start a kernel trace: ", *failure, "; nothing is recorded");
+    kLog.error("cannot start a kernel trace: ", begun.error().message, "; nothing is recorded");
     return kNotStarted;
   }
-  ours->recording = std::move(recording);
+  ours->recording = *std::move(begun);
   return 0;
 }
 
@@ -202,12 +200,13 @@ void LttngKtraceService::ktrace_end(const Session& session, int /*reason*/) {
 // Runs on the service's thread.
 void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& session) {
   if (session->recording.has_value()) {
-    const auto failure = control_.end(*session->recording);
-    if (failure) {
-      kLog.error("cannot end a kernel trace: ", *failure, "; delivering what was recorded");
+    const auto ended = control_.end(*session->recording);
+    if (!ended) {
+      kLog.error("cannot end a kernel trace: ", ended.error().message,
+                 "; delivering what was recorded");
     }
     const bool isRead = deliverAll(session);
-    if (failure || !isRead) failed_.add();
+    if (!ended || !isRead) failed_.add();
     control_.discard(*session->recording);
   }
   // After all batches, on the same queue, so the completion comes after the last event.

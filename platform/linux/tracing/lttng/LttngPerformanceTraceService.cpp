@@ -68,15 +68,13 @@ struct LttngPerformanceTraceService::Work {
 
   std::optional<Error> begin(std::optional<LttngControl::Recording>& recording) {
     started.add();
-    LttngControl::Recording begun;
     // LTTng's own events about loaded libraries are not events of a program.
-    const RecordingPlan plan{.event = "*", .filter = {}, .exclusions = {"lttng_ust_*"}};
-    if (auto failure = control.begin(plan, begun)) {
+    auto begun = control.begin({.event = "*", .filter = {}, .exclusions = {"lttng_ust_*"}});
+    if (!begun) {
       failed.add();
-      control.discard(begun);
-      return traceError(std::move(*failure));
+      return traceError(std::move(begun).error().message);
     }
-    recording = std::move(begun);
+    recording = *std::move(begun);
     return std::nullopt;
   }
 
@@ -84,9 +82,9 @@ struct LttngPerformanceTraceService::Work {
   void count(const std::optional<Error>& error) { (error ? failed : saved).add(); }
 
   std::optional<Error> end(const LttngControl::Recording& recording) {
-    auto failure = control.end(recording);
-    if (!failure) return std::nullopt;
-    return traceError(std::move(*failure));
+    auto ended = control.end(recording);
+    if (ended) return std::nullopt;
+    return traceError(std::move(ended).error().message);
   }
 
   // Sets the URL of the trace, or returns why there is none.
@@ -94,8 +92,8 @@ struct LttngPerformanceTraceService::Work {
     // The number keeps traces of one second apart.
     const std::string name = kTraceStart + timeText() + "-" + std::to_string(++saves) + kTraceEnd;
     const std::filesystem::path archive = control.tracesDirectory() / name;
-    auto failure = packDirectory(recording.directory, archive);
-    if (failure) return traceError("cannot save the trace: " + *failure);
+    const auto packed = packDirectory(recording.directory, archive);
+    if (!packed) return traceError("cannot save the trace: " + packed.error().message);
     // After the new archive is complete: a failure must not cost an old trace.
     removeOldTraces(control.tracesDirectory());
     url = "file://" + archive.string();

@@ -33,24 +33,23 @@ void SessionDaemon::adopt(const std::string& ownSessions) {
   static_cast<void>(keeper_.keep({noteFile_, ownSessions_}, *process_));
 }
 
-std::optional<std::string> SessionDaemon::start(const std::string& ownSessions) {
+Result<void> SessionDaemon::start(const std::string& ownSessions) {
   // A daemon of ours that runs but does not answer would keep a new one from starting.
   end();
   ownSessions_ = ownSessions;
-  DaemonProcess started;
-  auto failure = keeper_.start({noteFile_, ownSessions_}, started);
-  if (failure) return failure;
-  process_ = std::move(started);
+  auto started = keeper_.start({noteFile_, ownSessions_});
+  if (!started) return std::move(started).error();
+  process_ = *std::move(started);
   const auto deadline = std::chrono::steady_clock::now() + limits_.answersWithin;
   while (::lttng_session_daemon_alive() != 1) {
     const bool isGone = !process_->isAlive();
     if (isGone || std::chrono::steady_clock::now() > deadline) {
       end();
-      return isGone ? "lttng-sessiond ended at once" : "lttng-sessiond does not answer";
+      return Failure<>{isGone ? "lttng-sessiond ended at once" : "lttng-sessiond does not answer"};
     }
     std::this_thread::sleep_for(kLookEvery);
   }
-  return std::nullopt;
+  return {};
 }
 
 void SessionDaemon::end() {
@@ -65,7 +64,7 @@ void SessionDaemon::leave() {
   if (!process_.has_value()) return;
   // If the keeper was killed, another one does its work.
   if (!keeper_.release() && process_->isAlive() &&
-      !keeper_.keep({noteFile_, ownSessions_}, *process_)) {
+      keeper_.keep({noteFile_, ownSessions_}, *process_)) {
     keeper_.release();
   }
   process_.reset();

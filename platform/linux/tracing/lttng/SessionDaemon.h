@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 
+#include "platform/linux/base/Result.h"
 #include "platform/linux/tracing/lttng/DaemonProcess.h"
 #include "platform/linux/tracing/lttng/TracerKeeper.h"
 
@@ -37,9 +38,9 @@ class SessionDaemon {
   // session names; it must not be empty, or sessions of others would match.
   void adopt(const std::string& ownSessions);
   [[nodiscard]] bool isNoted() const;
-  // Ends our daemon if it does not answer any more, starts another and waits until that answers. If
-  // it does not, ends it and returns why.
-  [[nodiscard]] std::optional<std::string> start(const std::string& ownSessions);
+  // Ends our daemon if it does not answer any more, starts another and waits until that answers.
+  // Fails if it does not; then the daemon has been ended.
+  Result<void> start(const std::string& ownSessions);
   [[nodiscard]] bool isOurs() const { return process_.has_value(); }
   // Ends the daemon if it is ours, and waits until it has ended.
   void end();

@@ -109,7 +109,8 @@ class SessionDaemonTest : public testing::Test {
 };
 
 TEST_F(SessionDaemonTest, MissingProgramIsAnError) {
-  EXPECT_EQ(daemon_.start(kOwnSessions), "cannot start lttng-sessiond: No such file or directory");
+  EXPECT_EQ(daemon_.start(kOwnSessions).error().message,
+            "cannot start lttng-sessiond: No such file or directory");
 
   EXPECT_FALSE(daemon_.isOurs());
   EXPECT_FALSE(daemon_.isNoted());
@@ -119,7 +120,7 @@ TEST_F(SessionDaemonTest, DaemonThatEndsAtOnceIsReportedBeforeTheTimeLimit) {
   writeProgram("exit 1");
   SessionDaemon patient(note_, {.answersWithin = std::chrono::hours(1)});
 
-  EXPECT_EQ(patient.start(kOwnSessions), "lttng-sessiond ended at once");
+  EXPECT_EQ(patient.start(kOwnSessions).error().message, "lttng-sessiond ended at once");
 
   EXPECT_FALSE(patient.isOurs());
   EXPECT_FALSE(patient.isNoted());
@@ -128,7 +129,7 @@ TEST_F(SessionDaemonTest, DaemonThatEndsAtOnceIsReportedBeforeTheTimeLimit) {
 TEST_F(SessionDaemonTest, DaemonThatDoesNotAnswerIsEndedAndReported) {
   writeProgram("exec /bin/sleep 1000");
 
-  EXPECT_EQ(daemon_.start(kOwnSessions), "lttng-sessiond does not answer");
+  EXPECT_EQ(daemon_.start(kOwnSessions).error().message, "lttng-sessiond does not answer");
 
   EXPECT_FALSE(daemon_.isOurs());
   EXPECT_FALSE(daemon_.isNoted());
@@ -139,7 +140,7 @@ TEST_F(SessionDaemonTest, DaemonThatDoesNotAnswerIsEndedAndReported) {
 TEST_F(SessionDaemonTest, DaemonThatDoesNotHeedItsSignalIsKilled) {
   writeProgram("trap '' TERM; exec /bin/sleep 1000");
 
-  EXPECT_EQ(daemon_.start(kOwnSessions), "lttng-sessiond does not answer");
+  EXPECT_EQ(daemon_.start(kOwnSessions).error().message, "lttng-sessiond does not answer");
 
   ASSERT_GT(pid(), 1);
   EXPECT_FALSE(isThere(pid()));
@@ -201,7 +202,7 @@ TEST_F(SessionDaemonTest, DaemonThatDoesNotAnswerAnyMoreIsEndedBeforeAnotherIsSt
   std::ofstream(note_) << sleeper << ' ' << startTimeOf(sleeper) << '\n';
   daemon_.adopt(kOwnSessions);
 
-  EXPECT_NE(daemon_.start(kOwnSessions), std::nullopt);
+  EXPECT_FALSE(daemon_.start(kOwnSessions));
 
   EXPECT_EQ(::waitpid(sleeper, nullptr, WNOHANG), sleeper);
 }

@@ -18,43 +18,44 @@ namespace {
 
 using Archive = UniqueHandle<archive*, archive_write_free>;
 using Entry = UniqueHandle<archive_entry*, archive_entry_free>;
-using Failure = std::optional<std::string>;
 
 constexpr mode_t kArchivePermissions = 0600;
 constexpr mode_t kFilePermissions = 0644;
 
-Failure systemFailure(const std::filesystem::path& path) {
-  return path.string() + ": " + errnoText(errno);
+Failure<> systemFailure(const std::filesystem::path& path) {
+  return {path.string() + ": " + errnoText(errno)};
 }
 
-Failure archiveFailure(archive* to) {
+Failure<> archiveFailure(archive* to) {
   const char* const text = archive_error_string(to);
-  return std::string(text == nullptr ? "unknown error" : text);
+  return {text == nullptr ? "unknown error" : text};
 }
 
-Failure copy(archive* to, int file, std::uint64_t size, const std::filesystem::path& path) {
+Result<void> copy(archive* to, int file, std::uint64_t size, const std::filesystem::path& path) {
   std::array<char, 65'536> buffer;
   while (size > 0) {
     const std::size_t most = std::min<std::uint64_t>(size, buffer.size());
     const ssize_t count = ::read(file, buffer.data(), most);
     if (count < 0 && errno == EINTR) continue;
     if (count < 0) return systemFailure(path);
-    if (count == 0) return path.string() + ": the file became shorter while it was packed";
+    if (count == 0) {
+      return Failure<>{path.string() + ": the file became shorter while it was packed"};
+    }
     if (archive_write_data(to, buffer.data(), static_cast<std::size_t>(count)) != count) {
       return archiveFailure(to);
     }
     size -= static_cast<std::uint64_t>(count);
   }
-  return std::nullopt;
+  return {};
 }
 
 // O_NOFOLLOW and the check for a regular file keep anything out of the archive that is not part of
 // the recording.
-Failure addFile(archive* to, const std::filesystem::path& path, const std::string& name) {
+Result<void> addFile(archive* to, const std::filesystem::path& path, const std::string& name) {
   const UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK));
   struct stat status {};
   if (!file || ::fstat(file.get(), &status) != 0) return systemFailure(path);
-  if (!S_ISREG(status.st_mode)) return std::nullopt;
+  if (!S_ISREG(status.st_mode)) return {};
   const Entry entry(archive_entry_new());
   archive_entry_set_pathname(entry.get(), name.c_str());
   archive_entry_set_filetype(entry.get(), AE_IFREG);
@@ -66,12 +67,12 @@ Failure addFile(archive* to, const std::filesystem::path& path, const std::strin
   return copy(to, file.get(), static_cast<std::uint64_t>(status.st_size), path);
 }
 
-Failure write(const std::filesystem::path& directory, int file) {
+Result<void> write(const std::filesystem::path& directory, int file) {
   const Archive to(archive_write_new());
   if (!to || archive_write_set_format_pax_restricted(to.get()) != ARCHIVE_OK ||
       archive_write_add_filter_zstd(to.get()) != ARCHIVE_OK ||
       archive_write_open_fd(to.get(), file) != ARCHIVE_OK) {
-    return to ? archiveFailure(to.get()) : Failure("no memory");
+    return to ? archiveFailure(to.get()) : Failure<>{"no memory"};
   }
   std::error_code error;
   std::filesystem::recursive_directory_iterator entry(directory, error);
@@ -80,30 +81,28 @@ Failure write(const std::filesystem::path& directory, int file) {
     if (entry->is_directory()) continue;
     const std::filesystem::path name =
         directory.filename() / entry->path().lexically_relative(directory);
-    if (auto failure = addFile(to.get(), entry->path(), name.string())) return failure;
+    if (auto added = addFile(to.get(), entry->path(), name.string()); !added) return added;
   }
-  if (error) return directory.string() + ": " + error.message();
+  if (error) return Failure<>{directory.string() + ": " + error.message()};
   if (archive_write_close(to.get()) != ARCHIVE_OK) return archiveFailure(to.get());
-  return std::nullopt;
+  return {};
 }
 
 }  // namespace
 
-Failure packDirectory(const std::filesystem::path& directory,
-                      const std::filesystem::path& archive) {
+Result<void> packDirectory(const std::filesystem::path& directory,
+                           const std::filesystem::path& archive) {
   // In the scratch directory: what a killed service leaves there is removed at the next start.
   const std::filesystem::path unfinished = directory.string() + ".unfinished";
   constexpr int kFlags = O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW;
   const UniqueFd file(::open(unfinished.c_str(), kFlags, kArchivePermissions));
   if (!file) return systemFailure(unfinished);
-  Failure failure = write(directory, file.get());
+  Result<void> done = write(directory, file.get());
   // Before the name: after a power cut, an archive with a name must have its content.
-  if (!failure && ::fsync(file.get()) != 0) failure = systemFailure(unfinished);
-  if (!failure && ::rename(unfinished.c_str(), archive.c_str()) != 0) {
-    failure = systemFailure(archive);
-  }
-  if (failure) ::unlink(unfinished.c_str());
-  return failure;
+  if (done && ::fsync(file.get()) != 0) done = systemFailure(unfinished);
+  if (done && ::rename(unfinished.c_str(), archive.c_str()) != 0) done = systemFailure(archive);
+  if (!done) ::unlink(unfinished.c_str());
+  return done;
 }
 
 }  // namespace halvox::platform::linux_

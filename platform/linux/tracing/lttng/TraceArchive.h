@@ -1,8 +1,8 @@
 #pragma once
 
 #include <filesystem>
-#include <optional>
-#include <string>
+
+#include "platform/linux/base/Result.h"
 
 namespace halvox::platform::linux_ {
 
@@ -12,9 +12,9 @@ namespace halvox::platform::linux_ {
 // then it is a file beside the directory, which must be in the same file system. A service that is
 // killed leaves it there, where the next start deletes it.
 //
-// Blocks for the disk. Needs 64 KiB of memory and what the compression needs. Returns the failure
-// as a text; nothing is left of the archive then.
-[[nodiscard]] std::optional<std::string> packDirectory(const std::filesystem::path& directory,
-                                                       const std::filesystem::path& archive);
+// Blocks for the disk. Needs 64 KiB of memory and what the compression needs. After a failure
+// nothing is left of the archive.
+Result<void> packDirectory(const std::filesystem::path& directory,
+                           const std::filesystem::path& archive);
 
 }  // namespace halvox::platform::linux_

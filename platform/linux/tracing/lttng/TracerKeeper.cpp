@@ -54,14 +54,14 @@ std::string readLine(int descriptor, milliseconds within) {
 
 }  // namespace
 
-std::optional<std::string> TracerKeeper::launch(const Ward& ward, DaemonProcess& daemon) {
+Result<DaemonProcess> TracerKeeper::launch(const Ward& ward, DaemonProcess daemon) {
   release();
   const std::string path = keeperPath();
   const std::string failed = "cannot start " + path + ": ";
   auto life = makePipe();
-  if (!life) return failed + life.error().message;
+  if (!life) return Failure<>{failed + life.error().message};
   auto answer = makePipe();
-  if (!answer) return failed + answer.error().message;
+  if (!answer) return Failure<>{failed + answer.error().message};
   // A session of its own: a Ctrl-C in the service's terminal must not end the keeper before the
   // traces are read.
   ChildProgram program{.command = {path, ward.noteFile.string(), ward.ownSessions},
@@ -74,7 +74,7 @@ std::optional<std::string> TracerKeeper::launch(const Ward& ward, DaemonProcess&
     program.command.insert(program.command.end(), {std::to_string(daemon.pid), daemon.startTime});
   }
   auto started = ChildProcess::start(program);
-  if (!started) return started.error().message;
+  if (!started) return Failure<>{started.error().message};
   keeper_ = *std::move(started);
   // Only this process has the writing end. The kernel closes it, however the process ends.
   whileWeLive_ = std::move(life->writer);
@@ -86,20 +86,10 @@ std::optional<std::string> TracerKeeper::launch(const Ward& ward, DaemonProcess&
   const auto numberEnd = static_cast<std::size_t>(parsed.ptr - text.data());
   if (parsed.ec == std::errc() && text.substr(numberEnd).starts_with(' ')) {
     daemon.startTime = text.substr(numberEnd + 1);
-    return std::nullopt;
+    return daemon;
   }
   release();
-  return line.empty() ? path + " does not answer" : line;
-}
-
-std::optional<std::string> TracerKeeper::start(const Ward& ward, DaemonProcess& daemon) {
-  daemon = {};
-  return launch(ward, daemon);
-}
-
-std::optional<std::string> TracerKeeper::keep(const Ward& ward, const DaemonProcess& daemon) {
-  DaemonProcess kept = daemon;
-  return launch(ward, kept);
+  return Failure<>{line.empty() ? path + " does not answer" : line};
 }
 
 void TracerKeeper::awaitEarlier(const std::filesystem::path& noteFile, milliseconds within) {

@@ -6,6 +6,7 @@
 #include <string>
 
 #include "platform/linux/base/ChildProcess.h"
+#include "platform/linux/base/Result.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/tracing/lttng/DaemonProcess.h"
 
@@ -22,7 +23,7 @@ namespace halvox::platform::linux_ {
 // whether others use the daemon.
 //
 // The note file names the daemon, and its keeper holds a lock on the file. Belongs to one thread at
-// a time; SessionDaemon owns it. A keeper that cannot be started is a text for the log.
+// a time; SessionDaemon owns it.
 class TracerKeeper {
  public:
   struct Ward {
@@ -35,12 +36,13 @@ class TracerKeeper {
   TracerKeeper& operator=(const TracerKeeper&) = delete;
   ~TracerKeeper() { release(); }
 
-  // Starts a keeper, which starts a daemon. Returns why it could not; std::nullopt on success.
-  // Waits until the daemon has been started, but not until it answers.
-  [[nodiscard]] std::optional<std::string> start(const Ward& ward, DaemonProcess& daemon);
-  // Starts a keeper for a daemon that runs already. Returns why it could not; std::nullopt on
-  // success.
-  [[nodiscard]] std::optional<std::string> keep(const Ward& ward, const DaemonProcess& daemon);
+  // Starts a keeper, which starts a daemon. Waits until the daemon has been started, but not until
+  // it answers.
+  Result<DaemonProcess> start(const Ward& ward) { return launch(ward, {}); }
+  // Starts a keeper for a daemon that runs already.
+  Result<DaemonProcess> keep(const Ward& ward, const DaemonProcess& daemon) {
+    return launch(ward, daemon);
+  }
   // Waits until no keeper of an earlier service holds the note, at most `within`.
   static void awaitEarlier(const std::filesystem::path& noteFile, std::chrono::milliseconds within);
   // Lets the keeper do its work as at the end of the service, and waits until it has ended. Returns
@@ -48,7 +50,8 @@ class TracerKeeper {
   bool release();
 
  private:
-  [[nodiscard]] std::optional<std::string> launch(const Ward& ward, DaemonProcess& daemon);
+  // `daemon` has the number 0 if the keeper must start one.
+  Result<DaemonProcess> launch(const Ward& ward, DaemonProcess daemon);
 
   std::optional<ChildProcess> keeper_;
   UniqueFd whileWeLive_;  // the keeper sees when this is closed

@@ -29,6 +29,7 @@
 
 #include "platform/linux/base/ChildProcess.h"
 #include "platform/linux/base/ErrnoText.h"
+#include "platform/linux/base/Result.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/tracing/lttng/DaemonProcess.h"
 #include "platform/linux/tracing/lttng/TracerSessions.h"
@@ -67,7 +68,7 @@ void awaitEndOfService() {
   }
 }
 
-std::optional<DaemonProcess> startDaemon(std::string& failure) {
+Result<DaemonProcess> startDaemon() {
   // Runs in a session of its own, like the keeper: Ctrl-C in a terminal must not end the daemon
   // before its traces are read.
   auto started = ChildProcess::start({.command = {"lttng-sessiond", "--no-kernel"},
@@ -75,10 +76,7 @@ std::optional<DaemonProcess> startDaemon(std::string& failure) {
                                                       {.number = STDOUT_FILENO},
                                                       {.number = STDERR_FILENO}},
                                       .group = ChildProgram::Group::kOwnSession});
-  if (!started) {
-    failure = started.error().message;
-    return std::nullopt;
-  }
+  if (!started) return Failure<>{started.error().message};
   return DaemonProcess::withNumber(started->detach());
 }
 
@@ -96,19 +94,18 @@ bool isUsedByOthers(const DaemonProcess& daemon, std::string_view ownSessions) {
 }
 
 int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
-         std::optional<DaemonProcess> daemon) {
+         const std::optional<DaemonProcess>& named) {
   // The keeper alone holds the lock: the descriptor is not inherited by the daemon.
   const UniqueFd note(::open(noteFile.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644));
   if (!note || ::flock(note.get(), LOCK_EX) != 0) {
     say("cannot lock " + noteFile.string() + ": " + errnoText(errno));
     return EXIT_FAILURE;
   }
-  std::string failure;
-  if (!daemon) daemon = startDaemon(failure);
   std::error_code ignored;
+  const Result<DaemonProcess> daemon = named ? *named : startDaemon();
   if (!daemon) {
     std::filesystem::remove(noteFile, ignored);
-    say(failure);
+    say(daemon.error().message);
     return EXIT_FAILURE;
   }
   // Errors are ignored: the note is needed only by a service that starts after this keeper was
@@ -141,5 +138,5 @@ int main(int count, char** arguments) {
     // kill() takes 0 and -1 for whole groups of processes, and 1 is init.
     if (daemon->pid <= 1) return EXIT_FAILURE;
   }
-  return keep(words[1], words[2], std::move(daemon));
+  return keep(words[1], words[2], daemon);
 }
