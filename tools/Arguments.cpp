@@ -2,7 +2,9 @@
 
 #include <charconv>
 #include <cmath>
+#include <optional>
 #include <span>
+#include <string>
 
 #include "client/Vocabulary.h"
 
@@ -10,6 +12,8 @@ namespace halvox::tools {
 namespace {
 
 using client::NamedNumber;
+using platform::linux_::Failure;
+using platform::linux_::Result;
 
 template <typename Number>
 std::optional<Number> parseWhole(std::string_view text) {
@@ -62,30 +66,30 @@ std::optional<client::Category> parseNumberInDomain(std::string_view text) {
   return *domain | *number;
 }
 
-ArgumentError unknown(std::string_view text, const std::string& expected) {
+Failure<> unknown(std::string_view text, const std::string& expected) {
   return {"\"" + std::string(text) + "\" is not known; expected " + expected};
 }
 
 }  // namespace
 
-Parsed<client::ReporterID> parseReporterID(std::string_view text) {
+Result<client::ReporterID> parseReporterID(std::string_view text) {
   if (const auto id = parseWhole<client::ReporterID>(text)) return *id;
-  return ArgumentError{"\"" + std::string(text) +
-                       "\" is not a reporter ID; expected a whole number of 64 bits, such as 7"};
+  return Failure<>{"\"" + std::string(text) +
+                   "\" is not a reporter ID; expected a whole number of 64 bits, such as 7"};
 }
 
-Parsed<std::int64_t> parseNumber(std::string_view text) {
+Result<std::int64_t> parseNumber(std::string_view text) {
   if (const auto number = parseWhole<std::int64_t>(text)) return *number;
-  return ArgumentError{"\"" + std::string(text) + "\" is not a number; expected a whole number"};
+  return Failure<>{"\"" + std::string(text) + "\" is not a number; expected a whole number"};
 }
 
-Parsed<std::uint64_t> parseCount(std::string_view text) {
+Result<std::uint64_t> parseCount(std::string_view text) {
   if (const auto count = parseWhole<std::uint64_t>(text)) return *count;
-  return ArgumentError{"\"" + std::string(text) +
-                       "\" is not a number; expected a whole number of 0 or more, such as 10"};
+  return Failure<>{"\"" + std::string(text) +
+                   "\" is not a number; expected a whole number of 0 or more, such as 10"};
 }
 
-Parsed<client::Category> parseCategory(std::string_view text) {
+Result<client::Category> parseCategory(std::string_view text) {
   // Numbers first: a category can have any 32 bits, and most of them have no name.
   if (const auto number = parseWhole<client::Category>(text)) return *number;
   if (const auto category = client::findCategory(text)) return *category;
@@ -94,25 +98,25 @@ Parsed<client::Category> parseCategory(std::string_view text) {
                            ", alone or after one of " + listDomains());
 }
 
-Parsed<client::EventType> parseEventType(std::string_view text) {
+Result<client::EventType> parseEventType(std::string_view text) {
   if (const auto number = parseWhole<client::EventType>(text)) return *number;
   if (const auto type = client::findEventType(text)) return *type;
   return unknown(text, "a number up to 65535 or one of " + listNames(client::eventTypes()));
 }
 
-Parsed<client::ServiceType> parseServiceType(std::string_view text) {
+Result<client::ServiceType> parseServiceType(std::string_view text) {
   if (const auto number = parseWhole<client::ServiceType>(text)) return *number;
   if (const auto type = client::findServiceType(text)) return *type;
   return unknown(text, "a number up to 65535 or one of " + listNames(client::serviceTypes()));
 }
 
-Parsed<std::chrono::milliseconds> parseSeconds(std::string_view text) {
+Result<std::chrono::milliseconds> parseSeconds(std::string_view text) {
   // About 30 years. Keeps the conversion to milliseconds and later sums of times within 64 bits.
   constexpr double kMost = 1e9;
   const auto seconds = parseReal(text);
   if (!seconds || *seconds <= 0 || *seconds > kMost) {
-    return ArgumentError{"\"" + std::string(text) +
-                         "\" is not a time; expected seconds, more than 0, such as 0.5 or 10"};
+    return Failure<>{"\"" + std::string(text) +
+                     "\" is not a time; expected seconds, more than 0, such as 0.5 or 10"};
   }
   // Rounded up: 0.0001 seconds must not become 0.
   return std::chrono::ceil<std::chrono::milliseconds>(std::chrono::duration<double>(*seconds));

@@ -6,15 +6,13 @@ namespace halvox::tools {
 namespace {
 
 template <typename T>
-std::optional<T> valueOf(const Parsed<T>& parsed) {
-  const T* value = std::get_if<T>(&parsed);
-  return value != nullptr ? std::optional(*value) : std::nullopt;
+std::optional<T> valueOf(const platform::linux_::Result<T>& parsed) {
+  return parsed ? std::optional(*parsed) : std::nullopt;
 }
 
 template <typename T>
-std::string errorOf(const Parsed<T>& parsed) {
-  const auto* error = std::get_if<ArgumentError>(&parsed);
-  return error != nullptr ? error->message : "";
+std::string errorOf(const platform::linux_::Result<T>& parsed) {
+  return parsed ? "" : parsed.error().message;
 }
 
 TEST(ArgumentsTest, ReporterIDsAreWholeNumbersOf64Bits) {

@@ -6,7 +6,6 @@
 #include <optional>
 #include <string>
 #include <utility>
-#include <variant>
 #include <vector>
 
 #include <CLI/CLI.hpp>
@@ -80,18 +79,17 @@ class CommandSet {
 
 // Returns the value of `parsed`. Throws an error about the argument `shown` if it has none.
 template <typename T>
-T valueOf(Parsed<T> parsed, const std::string& shown) {
-  if (const auto* error = std::get_if<ArgumentError>(&parsed)) {
-    throw CLI::ValidationError(shown, error->message);
-  }
-  return std::get<T>(std::move(parsed));
+T valueOf(platform::linux_::Result<T> parsed, const std::string& shown) {
+  if (!parsed) throw CLI::ValidationError(shown, parsed.error().message);
+  return *std::move(parsed);
 }
 
 // Adds an argument or option that a function of tools/Arguments.h parses into `target`, which must
 // live as long as `app`.
 template <typename T, typename Target>
 CLI::Option* addParsed(CLI::App& app, const std::string& name, Target& target,
-                       Parsed<T> (*parse)(std::string_view), const std::string& description) {
+                       platform::linux_::Result<T> (*parse)(std::string_view),
+                       const std::string& description) {
   return app.add_option_function<std::string>(
       name,
       [&target, parse, name](const std::string& text) { target = valueOf(parse(text), name); },
@@ -101,7 +99,8 @@ CLI::Option* addParsed(CLI::App& app, const std::string& name, Target& target,
 // The same for an option that may be given several times; appends each value to `targets`.
 template <typename T, typename Targets>
 CLI::Option* addEach(CLI::App& app, const std::string& name, Targets& targets,
-                     Parsed<T> (*parse)(std::string_view), const std::string& description) {
+                     platform::linux_::Result<T> (*parse)(std::string_view),
+                     const std::string& description) {
   return app
       .add_option_function<std::vector<std::string>>(
           name,

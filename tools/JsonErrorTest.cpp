@@ -9,8 +9,7 @@ namespace {
 
 std::string errorOf(std::string_view json) {
   const auto parsed = parseDictionary(json);
-  const auto* error = std::get_if<ArgumentError>(&parsed);
-  return error != nullptr ? error->message : "";
+  return parsed ? "" : parsed.error().message;
 }
 
 TEST(JsonErrorTest, ReportsWhatWasExpectedAndFoundAndWhere) {

@@ -25,6 +25,8 @@ namespace {
 using platform::Array;
 using platform::Dictionary;
 using platform::Value;
+using platform::linux_::Failure;
+using platform::linux_::Result;
 using Writer = rapidjson::Writer<rapidjson::StringBuffer>;
 
 // The deepest nesting that fits on the wire, where each dictionary counts twice: once for itself
@@ -61,7 +63,7 @@ class Converter {
     return true;
   }
 
-  [[nodiscard]] ArgumentError error() const { return {"\"" + path_ + "\": " + reason_}; }
+  [[nodiscard]] Failure<> error() const { return {"\"" + path_ + "\": " + reason_}; }
 
  private:
   bool fail(const char* reason) {
@@ -269,16 +271,15 @@ std::string compact(const rapidjson::Value& json) {
 
 }  // namespace
 
-Parsed<Dictionary> parseDictionary(std::string_view json) {
+Result<Dictionary> parseDictionary(std::string_view json) {
   rapidjson::Document document;
   document.Parse<kParseFlags>(json.data(), json.size());
   if (document.HasParseError()) {
     std::istringstream text{std::string(json)};
-    return ArgumentError{
-        describeJsonError(text, document.GetErrorOffset(), document.GetParseError())};
+    return Failure<>{describeJsonError(text, document.GetErrorOffset(), document.GetParseError())};
   }
   if (!document.IsObject()) {
-    return ArgumentError{"expected a JSON object, such as {\"sample_rate\": 48000}"};
+    return Failure<>{"expected a JSON object, such as {\"sample_rate\": 48000}"};
   }
   Converter converter;
   Dictionary dictionary;

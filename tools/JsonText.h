@@ -3,8 +3,8 @@
 #include <string>
 #include <string_view>
 
+#include "platform/linux/base/Result.h"
 #include "platform/value.h"
-#include "tools/Arguments.h"
 
 // Dictionaries as JSON, and text that is safe to show.
 namespace halvox::tools {
@@ -12,7 +12,7 @@ namespace halvox::tools {
 // Parses a JSON object. Whole numbers keep their 64 bits, other numbers become doubles, true and
 // false become booleans. It is an error, with its place, if the text is anything but one object,
 // has a null, which messages cannot hold, or has a key twice.
-Parsed<platform::Dictionary> parseDictionary(std::string_view json);
+platform::linux_::Result<platform::Dictionary> parseDictionary(std::string_view json);
 
 // Formats a finite number with the fewest digits that read back as the same number: "0.1", "48000".
 std::string shortNumber(double number);

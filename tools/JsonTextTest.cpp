@@ -15,17 +15,14 @@ using platform::NumberKind;
 
 Dictionary dictionaryOf(std::string_view json) {
   const auto parsed = parseDictionary(json);
-  if (const auto* error = std::get_if<ArgumentError>(&parsed)) {
-    ADD_FAILURE() << error->message;
-    return {};
-  }
-  return std::get<Dictionary>(parsed);
+  if (parsed) return *parsed;
+  ADD_FAILURE() << parsed.error().message;
+  return {};
 }
 
 std::string errorOf(std::string_view json) {
   const auto parsed = parseDictionary(json);
-  const auto* error = std::get_if<ArgumentError>(&parsed);
-  return error != nullptr ? error->message : "";
+  return parsed ? "" : parsed.error().message;
 }
 
 std::string nested(std::size_t levels) {

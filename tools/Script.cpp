@@ -1,6 +1,5 @@
 #include "tools/Script.h"
 
-#include <optional>
 #include <utility>
 
 #include "tools/CommandLine.h"
@@ -10,6 +9,9 @@
 
 namespace halvox::tools {
 namespace {
+
+using platform::linux_::Failure;
+using platform::linux_::Result;
 
 constexpr std::string_view kBlanks = " \t\r";
 
@@ -36,7 +38,8 @@ class LineReader {
     }
     return true;
   }
-  [[nodiscard]] const std::optional<std::string>& error() const { return error_; }
+  // Whether the whole line could be read.
+  [[nodiscard]] const Result<void>& result() const { return result_; }
 
  private:
   bool takePiece(std::string& word) {
@@ -73,12 +76,12 @@ class LineReader {
   }
 
   bool fail(std::string reason) {
-    error_ = std::move(reason);
+    result_ = Failure<>{std::move(reason)};
     return false;
   }
 
   std::string_view rest_;
-  std::optional<std::string> error_;
+  Result<void> result_;
 };
 
 ExitStatus runLine(const std::vector<std::string>& words, RequestRunner& runner, bool json,
@@ -99,12 +102,12 @@ ExitStatus runLine(const std::vector<std::string>& words, RequestRunner& runner,
 
 }  // namespace
 
-Parsed<std::vector<std::string>> splitLine(std::string_view line) {
+Result<std::vector<std::string>> splitLine(std::string_view line) {
   LineReader reader(line);
   std::vector<std::string> words;
   std::string word;
   while (reader.next(word)) words.push_back(word);
-  if (reader.error()) return ArgumentError{*reader.error()};
+  if (!reader.result()) return reader.result().error();
   return words;
 }
 
@@ -122,19 +125,18 @@ ExitStatus runScript(const ScriptSource& source, const CommonOptions& options, s
     const std::string prefix = source.name + ":" + std::to_string(number) + ": ";
     ExitStatus status = ExitStatus::kDone;
     auto words = splitLine(line);
-    if (const auto* error = std::get_if<ArgumentError>(&words)) {
-      errors << prefix << harmlessText(error->message) << '\n';
+    if (!words) {
+      errors << prefix << harmlessText(words.error().message) << '\n';
       if (options.json) {
         const auto kind = failureKind(ExitStatus::kBadArguments);
-        out << failureJson("", {kind, "", error->message}) << '\n';
+        out << failureJson("", {kind, "", words.error().message}) << '\n';
       }
       status = ExitStatus::kBadArguments;
     } else {
-      auto& list = std::get<std::vector<std::string>>(words);
-      if (list.empty()) continue;
-      if (list.front() == "quit" || list.front() == "exit") break;
-      if (list.front() == "help") list.front() = "--help";
-      status = runLine(list, runner, options.json, out, errors, prefix, source.lines);
+      if (words->empty()) continue;
+      if (words->front() == "quit" || words->front() == "exit") break;
+      if (words->front() == "help") words->front() = "--help";
+      status = runLine(*words, runner, options.json, out, errors, prefix, source.lines);
     }
     if (result == ExitStatus::kDone) result = status;
     // Also with --keep-going: the script's sessions have ended with their connection.

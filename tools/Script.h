@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "tools/Arguments.h"
+#include "platform/linux/base/Result.h"
 #include "tools/Command.h"
 
 namespace halvox::tools {
@@ -21,7 +21,7 @@ struct RunShell {};
 // Splits a line into words by the shell's rules for blanks, quotes and backslashes, without the
 // shell's expansions. A word that begins with "{" outside of quotes is the unchanged rest of the
 // line, so that JSON needs no quotes. "#" at the beginning of a word starts a comment.
-Parsed<std::vector<std::string>> splitLine(std::string_view line);
+platform::linux_::Result<std::vector<std::string>> splitLine(std::string_view line);
 
 // The lines of a script, and their name in error messages.
 struct ScriptSource {

@@ -14,8 +14,7 @@ using Words = std::vector<std::string>;
 
 Words wordsOf(std::string_view line) {
   auto words = splitLine(line);
-  if (const auto* error = std::get_if<ArgumentError>(&words)) return {"error", error->message};
-  return std::get<Words>(words);
+  return words ? *words : Words{"error", words.error().message};
 }
 
 TEST(SplitLineTest, SplitsAtBlanksAsAShellDoes) {

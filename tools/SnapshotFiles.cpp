@@ -4,7 +4,6 @@
 #include <filesystem>
 #include <iomanip>
 #include <map>
-#include <optional>
 #include <sstream>
 #include <string>
 #include <system_error>
@@ -13,7 +12,6 @@
 #include <vector>
 
 #include "platform/linux/diagnostics/SnapshotDirectory.h"
-#include "tools/Arguments.h"
 #include "tools/JsonText.h"
 #include "tools/ServiceConfiguration.h"
 #include "tools/SnapshotReader.h"
@@ -80,10 +78,10 @@ Result<Contents> readContents(const fs::path& file) {
       return Failure<>{file.native() + ": not a snapshot: it has no " + name};
     }
     auto parsed = parseDictionary(text->second);
-    if (auto* error = std::get_if<ArgumentError>(&parsed)) {
-      return Failure<>{file.native() + ": " + name + " in it: " + error->message};
+    if (!parsed) {
+      return Failure<>{file.native() + ": " + name + " in it: " + parsed.error().message};
     }
-    *target = std::get<Dictionary>(std::move(parsed));
+    *target = *std::move(parsed);
   }
   return contents;
 }

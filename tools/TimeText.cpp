@@ -13,6 +13,9 @@
 namespace halvox::tools {
 namespace {
 
+using platform::linux_::Failure;
+using platform::linux_::Result;
+
 constexpr double kMinute = 60;
 constexpr double kHour = 60 * kMinute;
 constexpr double kDay = 24 * kHour;
@@ -178,7 +181,7 @@ double midnight(double now, int daysBefore) {
 
 }  // namespace
 
-Parsed<double> parseTime(std::string_view text, double now) {
+Result<double> parseTime(std::string_view text, double now) {
   if (text == "now") return now;
   if (text == "today") return midnight(now, 0);
   if (text == "yesterday") return midnight(now, 1);
@@ -187,11 +190,10 @@ Parsed<double> parseTime(std::string_view text, double now) {
   }
   if (const auto age = parseAge(text)) return now - *age;
   if (const auto time = parseCalendarTime(text)) return *time;
-  return ArgumentError{
-      "\"" + std::string(text) +
-      "\" is not a time; expected one such as \"2026-11-21 22:44\", "
-      "2026-11-21T22:44:05+01:00, today, yesterday, 5min or 2h (that long ago), or "
-      "@1795313222 (seconds since 1970)"};
+  return Failure<>{"\"" + std::string(text) +
+                   "\" is not a time; expected one such as \"2026-11-21 22:44\", "
+                   "2026-11-21T22:44:05+01:00, today, yesterday, 5min or 2h (that long ago), or "
+                   "@1795313222 (seconds since 1970)"};
 }
 
 std::string localTime(double seconds) {

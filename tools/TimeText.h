@@ -3,7 +3,7 @@
 #include <string>
 #include <string_view>
 
-#include "tools/Arguments.h"
+#include "platform/linux/base/Result.h"
 
 // Converts between times in seconds since 1970 and texts that people type and commands print.
 namespace halvox::tools {
@@ -14,7 +14,7 @@ namespace halvox::tools {
 //   today, yesterday (the midnight at which they began), now
 //   5min, 90s, 2h, 3d, 1w, optionally with "-" before them: that long before `now`
 //   @1795313222.7, 1795313222.7: seconds since 1970
-Parsed<double> parseTime(std::string_view text, double now);
+platform::linux_::Result<double> parseTime(std::string_view text, double now);
 
 // Formats a time as local time, rounded down to milliseconds: "2026-11-21 22:44:05.123".
 std::string localTime(double seconds);

@@ -11,9 +11,8 @@ namespace {
 constexpr double kNow = 1'000'000;  // 1970-01-12 13:46:40 UTC
 
 template <typename T>
-std::optional<T> valueOf(const Parsed<T>& parsed) {
-  const T* value = std::get_if<T>(&parsed);
-  return value != nullptr ? std::optional(*value) : std::nullopt;
+std::optional<T> valueOf(const platform::linux_::Result<T>& parsed) {
+  return parsed ? std::optional(*parsed) : std::nullopt;
 }
 
 class TimeTextTest : public testing::Test {
@@ -87,7 +86,7 @@ TEST_F(TimeTextTest, TimesThatCommandsPrintAreTaken) {
 }
 
 TEST_F(TimeTextTest, WrongTimesAreReportedWithExamples) {
-  const auto error = std::get<ArgumentError>(parseTime("tea", kNow)).message;
+  const auto error = parseTime("tea", kNow).error().message;
 
   for (const char* part :
        {"\"tea\" is not a time", "\"2026-11-21 22:44\"", "yesterday", "5min", "@"}) {

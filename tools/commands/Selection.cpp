@@ -3,6 +3,7 @@
 #include <chrono>
 #include <string>
 
+#include "platform/linux/base/Result.h"
 #include "tools/Arguments.h"
 #include "tools/CommandSet.h"
 #include "tools/TimeText.h"
@@ -10,7 +11,7 @@
 namespace halvox::tools {
 namespace {
 
-Parsed<double> parseTimeNow(std::string_view text) {
+platform::linux_::Result<double> parseTimeNow(std::string_view text) {
   // The store has times of the wall clock.
   const auto now = std::chrono::system_clock::now().time_since_epoch();
   return parseTime(text, std::chrono::duration<double>(now).count());

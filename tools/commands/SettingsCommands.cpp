@@ -9,11 +9,12 @@ namespace {
 
 using Action = Preferences::Action;
 
-Parsed<Action> parseAction(std::string_view text) {
+platform::linux_::Result<Action> parseAction(std::string_view text) {
   if (text == "get") return Action::kGet;
   if (text == "set") return Action::kSet;
   if (text == "unset") return Action::kUnset;
-  return ArgumentError{"\"" + std::string(text) + "\" is not known; expected get, set or unset"};
+  return platform::linux_::Failure<>{"\"" + std::string(text) +
+                                     "\" is not known; expected get, set or unset"};
 }
 
 Preferences checked(const Preferences& request) {
