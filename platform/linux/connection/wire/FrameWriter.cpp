@@ -88,75 +88,31 @@ bool isValid(const CallTarget& target, std::uint32_t serial) {
 
 // Nearly all replies have no value or a boolean, and go to a client without a bus name. Their
 // frames differ in three numbers only, so they are copied from a constant instead of being built.
-constexpr std::size_t kPlainReplyBytes = 24;
-constexpr std::size_t kBooleanReplyBytes = 36;
-constexpr std::array<char, kBooleanReplyBytes> kPlainReply{'l',
-                                                           2,
-                                                           kNoReplyExpected,
-                                                           kProtocolVersion,  // fixed part; no body
-                                                           0,
-                                                           0,
-                                                           0,
-                                                           0,  //
-                                                           0,
-                                                           0,
-                                                           0,
-                                                           0,  // serial
-                                                           8,
-                                                           0,
-                                                           0,
-                                                           0,  // bytes of fields
-                                                           5,
-                                                           1,
-                                                           'u',
-                                                           0,  // reply serial
-                                                           0,
-                                                           0,
-                                                           0,
-                                                           0};
-constexpr std::array<char, kBooleanReplyBytes> kBooleanReply{
-    'l',
-    2,
-    kNoReplyExpected,
-    kProtocolVersion,  // fixed part; a body of 4 bytes
-    4,
-    0,
-    0,
-    0,  //
-    0,
-    0,
-    0,
-    0,  // serial
-    15,
-    0,
-    0,
-    0,  // bytes of fields
-    5,
-    1,
-    'u',
-    0,  // reply serial
-    0,
-    0,
-    0,
-    0,  //
-    8,
-    1,
-    'g',
-    0,  // signature, and a byte of padding
-    1,
-    'b',
-    0,
-    0,  //
-    0,
-    0,
-    0,
-    0};
+// The zeros of the serials and of the value are filled in.
+constexpr std::string_view kPlainReply(
+    "l\2\1\1"    // kMethodReturn, kNoReplyExpected, kProtocolVersion
+    "\0\0\0\0"   // no body
+    "\0\0\0\0"   // serial
+    "\10\0\0\0"  // bytes of fields
+    "\5\1u\0"    // kReplySerial of type "u"
+    "\0\0\0\0",  // reply serial
+    24);
+constexpr std::string_view kBooleanReply(
+    "l\2\1\1"
+    "\4\0\0\0"   // a body of 4 bytes
+    "\0\0\0\0"   // serial
+    "\17\0\0\0"  // bytes of fields
+    "\5\1u\0"
+    "\0\0\0\0"         // reply serial
+    "\10\1g\0\1b\0\0"  // kSignature of type "g": "b", and a byte of padding
+    "\0\0\0\0",        // value
+    36);
 constexpr std::size_t kReplySerialOffset = 20;
 constexpr std::size_t kBooleanOffset = 32;
 
 void appendPlainReply(std::string& out, std::uint32_t replySerial, std::uint32_t serial) {
   const std::size_t start = out.size();
-  out.append(kPlainReply.data(), kPlainReplyBytes);
+  out += kPlainReply;
   putLittleEndian(&out[start + kSerialOffset], serial);
   putLittleEndian(&out[start + kReplySerialOffset], replySerial);
 }
@@ -164,7 +120,7 @@ void appendPlainReply(std::string& out, std::uint32_t replySerial, std::uint32_t
 void appendBooleanReply(std::string& out, std::uint32_t replySerial, std::uint32_t serial,
                         bool value) {
   const std::size_t start = out.size();
-  out.append(kBooleanReply.data(), kBooleanReplyBytes);
+  out += kBooleanReply;
   putLittleEndian(&out[start + kSerialOffset], serial);
   putLittleEndian(&out[start + kReplySerialOffset], replySerial);
   out[start + kBooleanOffset] = value ? 1 : 0;
