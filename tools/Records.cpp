@@ -7,6 +7,7 @@
 #include <span>
 #include <string_view>
 
+#include "platform/linux/base/Hexadecimal.h"
 #include "platform/protobuf.h"
 #include "tools/JsonText.h"
 #include "tools/LinkNames.h"
@@ -18,6 +19,7 @@ namespace {
 
 using platform::ProtoReader;
 using platform::linux_::EventFollower;
+using platform::linux_::hexadecimal;
 using platform::linux_::RecordFilter;
 using platform::linux_::RecordTable;
 using platform::linux_::StoredRecord;
@@ -83,17 +85,6 @@ std::optional<std::string> audioIssueAsJson(const std::string& bytes) {
       ",\"rtaid_client\":" + tools::quoted(texts[2]) + ",\"duration\":" + std::to_string(duration);
   if (timestamp) json += ",\"timestamp\":" + std::to_string(*timestamp);
   return json + "}";
-}
-
-std::string hexadecimal(std::string_view bytes) {
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  std::string text;
-  for (const char byte : bytes) {
-    const auto value = static_cast<unsigned char>(byte);
-    text += kDigits[value >> 4U];
-    text += kDigits[value & 0xFU];
-  }
-  return text;
 }
 
 std::string metricID(std::int64_t metric) {

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "platform/linux/base/Hexadecimal.h"
+
 namespace halvox::platform::linux_::dbus {
 namespace {
 
@@ -40,16 +42,6 @@ std::string fromHex(std::string_view hex) {
     bytes += static_cast<char>(16 * digitOf(hex[index]) + digitOf(hex[index + 1]));
   }
   return bytes;
-}
-
-std::string toHex(std::string_view bytes) {
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  std::string hex;
-  for (const char byte : bytes) {
-    hex += kDigits[static_cast<unsigned char>(byte) / 16];
-    hex += kDigits[static_cast<unsigned char>(byte) % 16];
-  }
-  return hex;
 }
 
 std::string quoted(std::string_view line) {
@@ -205,7 +197,7 @@ void ServerHandshake::fail(std::string error) {
 
 void ClientHandshake::start(std::string& output) const {
   output += '\0';
-  output += "AUTH EXTERNAL " + toHex(std::to_string(uid_)) + "\r\n";
+  output += "AUTH EXTERNAL " + hexadecimal(std::to_string(uid_)) + "\r\n";
 }
 
 HandshakeProgress ClientHandshake::feed(std::span<const std::byte> input, std::string& output) {

@@ -7,25 +7,16 @@
 #include <string>
 #include <vector>
 
+#include "platform/linux/base/Hexadecimal.h"
 #include "platform/linux/connection/wire/FrameWriter.h"
 #include "platform/linux/connection/wire/testdata/TestFrames.h"
 
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-std::string toHex(std::string_view bytes) {
-  constexpr std::string_view kDigits = "0123456789abcdef";
-  std::string hex;
-  for (const char byte : bytes) {
-    hex += kDigits[static_cast<unsigned char>(byte) / 16];
-    hex += kDigits[static_cast<unsigned char>(byte) % 16];
-  }
-  return hex;
-}
-
 // False when the frame could not be written.
 bool print(bool written, std::string_view frame, std::string_view body) {
-  if (written) std::cout << toHex(frame) << '\t' << body << '\n';
+  if (written) std::cout << hexadecimal(frame) << '\t' << body << '\n';
   return written;
 }
 
