@@ -1,12 +1,8 @@
 #pragma once
 
-#include <atomic>
-#include <cstdint>
-
 #include "platform/clock.h"
-#include "platform/linux/link/local/CallbackThread.h"
+#include "platform/linux/link/local/ServerlessTlmReportingService.h"
 #include "platform/linux/store/SqliteStore.h"
-#include "platform/tlm_reporting.h"
 
 namespace halvox::platform::linux_ {
 
@@ -19,34 +15,19 @@ namespace halvox::platform::linux_ {
 // Threads: any may call; a call blocks while the store's queue is full.
 // Owner: the platform, which also owns the store, the clock and the callback thread. They must
 // outlive this object and its sessions.
-class LocalTlmReportingService final : public TLMReportingService {
+class LocalTlmReportingService final : public ServerlessTlmReportingService {
  public:
   // Discoveries are answered on the thread of `callbacks`.
-  LocalTlmReportingService(SqliteStore& store, const ClockService& clock, CallbackThread& callbacks)
-      : records_(store.linkMessages()), clock_(clock), callbacks_(callbacks) {}
-
-  Token TLMHierarchyTokenCreate() override;
-  Session TLMReportingCreateSession(const Dictionary& sessionInfo,
-                                    const Dictionary& userInfo) override;
-  void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) override;
-  // Fails only after the store was closed.
-  TLMReportingOutcome TLMReportingSendMessage(const Session& session,
-                                              const TLMReportingMessage& message) override;
-  void TLMReportingFlushMessages(const Session& session, std::function<void()> flushed) override;
-  TLMReportingOutcome TLMReportingSendOneMessage(const Dictionary& sessionInfo,
-                                                 const Dictionary& userInfo,
-                                                 const TLMReportingMessage& message) override;
+  LocalTlmReportingService(SqliteStore& store, const ClockService& clock,
+                           CallbackThread& callbacks);
 
  private:
-  class LocalSession;
-
-  TLMReportingOutcome record(std::shared_ptr<const LinkParty> party,
-                             const TLMReportingMessage& message);
+  // Refuses a message only after the store was closed.
+  TLMReportingOutcome accept(const std::shared_ptr<const LinkParty>& sender,
+                             const TLMReportingMessage& message) override;
 
   LinkMessageRecords& records_;
   const ClockService& clock_;
-  CallbackThread& callbacks_;
-  std::atomic<std::uint64_t> lastToken_{0};  // orders nothing; only unique
 };
 
 }  // namespace halvox::platform::linux_
