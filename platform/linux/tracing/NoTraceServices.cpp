@@ -6,7 +6,7 @@
 #include <utility>
 
 #include "platform/linux/base/Mutex.h"
-#include "platform/services.h"
+#include "platform/linux/tracing/QueueOnDemand.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -113,27 +113,14 @@ class NoPerformanceTraceService final : public PerformanceTraceService {
   }
   std::shared_ptr<KQTraceSession> initWithConfig(
       std::shared_ptr<KQTraceConfig> /*configuration*/) override {
-    return std::make_shared<NoTraceSession>(queue(), reason_);
+    return std::make_shared<NoTraceSession>(queue_.get(), reason_);
   }
   // Releases the queue. Call it after the queues have ended.
-  void close() {
-    const MutexLock lock(mutex_);
-    queue_.reset();
-  }
+  void close() { queue_.release(); }
 
  private:
-  std::shared_ptr<DispatchQueue> queue() {
-    const MutexLock lock(mutex_);
-    if (queue_ == nullptr) {
-      queue_ = platform::dispatch().createSerialQueue(
-          "Performance Trace", QualityOfService::kUtility, QueueThreading::kShared);
-    }
-    return queue_;
-  }
-
   const std::string reason_;
-  Mutex mutex_;
-  std::shared_ptr<DispatchQueue> queue_ HALVOX_GUARDED_BY(mutex_);  // made when needed
+  QueueOnDemand queue_{{"Performance Trace", QualityOfService::kUtility, QueueThreading::kShared}};
 };
 
 class NoTraceServices final : public TraceServices {

@@ -131,21 +131,6 @@ LttngKtraceService::LttngKtraceService(LttngControl& control, StatisticsService&
 
 void LttngKtraceService::stop() { gate_.stop(); }
 
-void LttngKtraceService::close() {
-  const MutexLock lock(mutex_);
-  readingQueue_.reset();
-}
-
-std::shared_ptr<DispatchQueue> LttngKtraceService::readingQueue() {
-  const MutexLock lock(mutex_);
-  if (readingQueue_ == nullptr) {
-    // Not of a lower quality: a stop waits for it on the reporting queue.
-    readingQueue_ = platform::dispatch().createSerialQueue(
-        "Trace Reading", QualityOfService::kUserInteractive, QueueThreading::kOwnThread);
-  }
-  return readingQueue_;
-}
-
 KtraceService::Session LttngKtraceService::ktrace_session_create() {
   return std::make_shared<LttngKtraceSession>();
 }
@@ -194,7 +179,8 @@ void LttngKtraceService::ktrace_end(const Session& session, int /*reason*/) {
   if (ours == nullptr) return;
   ours->state = State::kEnded;
   // Ending and reading take seconds. The caller must not wait for them.
-  readingQueue()->async(JobWeight::kMayBlock, [this, ours = std::move(ours)] { finish(ours); });
+  readingQueue_.get()->async(JobWeight::kMayBlock,
+                             [this, ours = std::move(ours)] { finish(ours); });
 }
 
 // Runs on the service's thread.

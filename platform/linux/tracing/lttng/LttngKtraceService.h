@@ -5,6 +5,7 @@
 #include "platform/dispatch.h"
 #include "platform/ktrace.h"
 #include "platform/linux/base/Mutex.h"
+#include "platform/linux/tracing/QueueOnDemand.h"
 #include "platform/linux/tracing/lttng/LttngControl.h"
 #include "platform/statistics.h"
 
@@ -54,7 +55,7 @@ class LttngKtraceService final : public KtraceService {
   // counted.
   void stop();
   // Releases the queue. Call it after the queues have ended.
-  void close();
+  void close() { readingQueue_.release(); }
 
   Session ktrace_session_create() override;
   void ktrace_set_completion_handler(const Session& session,
@@ -72,7 +73,6 @@ class LttngKtraceService final : public KtraceService {
   void finish(const std::shared_ptr<LttngKtraceSession>& session);
   // Returns whether the recording could be read to its end.
   bool deliverAll(const std::shared_ptr<LttngKtraceSession>& session);
-  std::shared_ptr<DispatchQueue> readingQueue();
 
   static constexpr unsigned kBatchesAhead = 8;  // of 4,096 events each
 
@@ -85,8 +85,9 @@ class LttngKtraceService final : public KtraceService {
   Counter& lost_;
   Counter& lostPackets_;
   DeliveryGate gate_{kBatchesAhead};
-  Mutex mutex_;
-  std::shared_ptr<DispatchQueue> readingQueue_ HALVOX_GUARDED_BY(mutex_);  // made when needed
+  // Not of a lower quality: a stop waits for it on the reporting queue.
+  QueueOnDemand readingQueue_{
+      {"Trace Reading", QualityOfService::kUserInteractive, QueueThreading::kOwnThread}};
 };
 
 }  // namespace halvox::platform::linux_

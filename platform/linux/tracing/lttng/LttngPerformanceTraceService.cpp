@@ -184,21 +184,6 @@ LttngPerformanceTraceService::LttngPerformanceTraceService(LttngControl& control
                .saved = statistics.counter("performance traces", "traces saved"),
                .givenUp = statistics.counter("performance traces", "traces given up")})) {}
 
-void LttngPerformanceTraceService::close() {
-  const MutexLock lock(mutex_);
-  queue_.reset();
-}
-
-std::shared_ptr<DispatchQueue> LttngPerformanceTraceService::queue() {
-  const MutexLock lock(mutex_);
-  if (queue_ == nullptr) {
-    // Not of a lower quality: a stop waits for it on the reporting queue.
-    queue_ = platform::dispatch().createSerialQueue(
-        "Performance Trace", QualityOfService::kUserInteractive, QueueThreading::kOwnThread);
-  }
-  return queue_;
-}
-
 std::shared_ptr<KQTraceConfig> LttngPerformanceTraceService::configWithTemplate(
     std::int32_t number) {
   return std::make_shared<TemplateConfig>(number);
@@ -206,7 +191,7 @@ std::shared_ptr<KQTraceConfig> LttngPerformanceTraceService::configWithTemplate(
 
 std::shared_ptr<KQTraceSession> LttngPerformanceTraceService::initWithConfig(
     std::shared_ptr<KQTraceConfig> /*configuration*/) {
-  return std::make_shared<LttngTraceSession>(work_, queue());
+  return std::make_shared<LttngTraceSession>(work_, queue_.get());
 }
 
 }  // namespace halvox::platform::linux_

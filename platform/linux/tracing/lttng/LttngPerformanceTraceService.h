@@ -2,8 +2,7 @@
 
 #include <memory>
 
-#include "platform/dispatch.h"
-#include "platform/linux/base/Mutex.h"
+#include "platform/linux/tracing/QueueOnDemand.h"
 #include "platform/linux/tracing/lttng/LttngControl.h"
 #include "platform/performance_trace.h"
 #include "platform/statistics.h"
@@ -27,7 +26,7 @@ class LttngPerformanceTraceService final : public PerformanceTraceService {
   LttngPerformanceTraceService(LttngControl& control, StatisticsService& statistics);
 
   // Releases the queue. Call it after the queues have ended.
-  void close();
+  void close() { queue_.release(); }
 
   std::shared_ptr<KQTraceConfig> configWithTemplate(std::int32_t number) override;
   std::shared_ptr<KQTraceSession> initWithConfig(
@@ -36,11 +35,10 @@ class LttngPerformanceTraceService final : public PerformanceTraceService {
   struct Work;
 
  private:
-  std::shared_ptr<DispatchQueue> queue();
-
   const std::shared_ptr<Work> work_;  // shared with the sessions
-  Mutex mutex_;
-  std::shared_ptr<DispatchQueue> queue_ HALVOX_GUARDED_BY(mutex_);  // made when needed
+  // Not of a lower quality: a stop waits for it on the reporting queue.
+  QueueOnDemand queue_{
+      {"Performance Trace", QualityOfService::kUserInteractive, QueueThreading::kOwnThread}};
 };
 
 }  // namespace halvox::platform::linux_
