@@ -8,6 +8,7 @@
 #include <sys/socket.h>
 #include <sys/un.h>
 
+#include "client/Overloaded.h"
 #include "client/WireValue.h"
 #include "platform/linux/base/ErrnoText.h"
 
@@ -18,13 +19,6 @@ using platform::linux_::UniqueFd;
 
 constexpr const char* kObjectPath = "/com/tarno/halvox/reporting";
 constexpr const char* kInterface = "com.tarno.halvox.HVReportingServiceProtocol";
-
-template <typename... Cases>
-struct Overloaded : Cases... {
-  using Cases::operator()...;
-};
-template <typename... Cases>
-Overloaded(Cases...) -> Overloaded<Cases...>;
 
 Failure badRequest(std::string message) {
   return {Failure::Kind::kBadRequest, "", std::move(message)};

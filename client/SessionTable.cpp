@@ -2,17 +2,9 @@
 
 #include <algorithm>
 
+#include "client/Overloaded.h"
+
 namespace halvox::client {
-namespace {
-
-template <typename... Cases>
-struct Overloaded : Cases... {
-  using Cases::operator()...;
-};
-template <typename... Cases>
-Overloaded(Cases...) -> Overloaded<Cases...>;
-
-}  // namespace
 
 void SessionTable::apply(const SessionOperation& operation) {
   if (std::holds_alternative<CreateSession>(operation.step)) {

@@ -1,0 +1,13 @@
+#pragma once
+
+namespace halvox::client {
+
+// Joins function objects into one that std::visit() can call with each alternative of a variant.
+template <typename... Cases>
+struct Overloaded : Cases... {
+  using Cases::operator()...;
+};
+template <typename... Cases>
+Overloaded(Cases...) -> Overloaded<Cases...>;
+
+}  // namespace halvox::client
