@@ -10,7 +10,7 @@ import tempfile
 import wave
 from pathlib import Path
 
-from harness import BIN, stop_process, wait_for
+from harness import BIN, stop_process, voluntary_switches, wait_for
 
 REPORTER = BIN / "halvox-pipewire-reporter"
 PRIVATE_PIPEWIRE = Path(__file__).resolve().parents[2] / "scripts/lib/private-pipewire.sh"
@@ -107,10 +107,4 @@ class Reporter:
         return self.log_path.read_text(errors="replace")
 
     def voluntary_switches(self):
-        """How often its threads have gone to sleep so far: each time is one wake-up."""
-        total = 0
-        for status in Path(f"/proc/{self.process.pid}/task").glob("*/status"):
-            for line in status.read_text().splitlines():
-                if line.startswith("voluntary_ctxt_switches:"):
-                    total += int(line.split()[1])
-        return total
+        return voluntary_switches(self.process)

@@ -115,7 +115,33 @@ class NotifySocket:
         self._socket.close()
 
 
-class Service:
+def voluntary_switches(process):
+    """How often the threads of a process have gone to sleep so far: each time is one wake-up."""
+    total = 0
+    for status in Path(f"/proc/{process.pid}/task").glob("*/status"):
+        for line in status.read_text().splitlines():
+            if line.startswith("voluntary_ctxt_switches:"):
+                total += int(line.split()[1])
+    return total
+
+
+class Startable:
+    """A context that starts a server, stops it, and then deletes its directory if that is its own."""
+
+    _owns_directory = True
+
+    def __enter__(self):
+        return self.start()
+
+    def __exit__(self, *_):
+        try:
+            self.stop()
+        finally:
+            if self._owns_directory:
+                shutil.rmtree(self.directory, ignore_errors=True)
+
+
+class Service(Startable):
     """The built service with its own directories. Use as a context manager or call stop()."""
 
     def __init__(self, config="", bus="none", environment=None, directory=None, command=None,
@@ -167,16 +193,6 @@ class Service:
         status = stop_process(self.process, signal_number) if self.process else None
         return status
 
-    def __enter__(self):
-        return self.start()
-
-    def __exit__(self, *_):
-        try:
-            self.stop()
-        finally:
-            if self._owns_directory:
-                shutil.rmtree(self.directory, ignore_errors=True)
-
     @property
     def address(self):
         return f"unix:path={self.socket}"
@@ -217,13 +233,16 @@ class Service:
         return len(os.listdir(f"/proc/{self.process.pid}/task"))
 
     def voluntary_switches(self):
-        """How often the threads of the service have gone to sleep so far: each time is one wake-up."""
-        total = 0
-        for status in Path(f"/proc/{self.process.pid}/task").glob("*/status"):
-            for line in status.read_text().splitlines():
-                if line.startswith("voluntary_ctxt_switches:"):
-                    total += int(line.split()[1])
-        return total
+        return voluntary_switches(self.process)
+
+
+def start_session(test, service, reporter):
+    """Starts a session. Returns its client, which is closed after the test."""
+    client = service.client()
+    test.addCleanup(client.close)
+    client.create(reporter)
+    client.start_later(reporter)
+    return client
 
 
 class Follower:

@@ -14,7 +14,7 @@ import threading
 import time
 from pathlib import Path
 
-from harness import BIN, DEADLINE, WITH_US, stop_process, wait_for
+from harness import BIN, DEADLINE, WITH_US, Startable, stop_process, wait_for
 
 DRIVER = BIN / "halvox_link_driver"
 READER = BIN / "halvox_stream_reader"
@@ -39,7 +39,7 @@ def accepts(port):
         return probe.connect_ex(("127.0.0.1", port)) == 0
 
 
-class Server:
+class Server(Startable):
     """One nats-server with JetStream in a directory of its own. Use as a context manager."""
 
     def __init__(self, extra="", port=None, name="one", scheme="nats"):
@@ -86,15 +86,6 @@ class Server:
     def stop(self):
         if self.process is not None:
             stop_process(self.process)
-
-    def __enter__(self):
-        return self.start()
-
-    def __exit__(self, *_):
-        try:
-            self.stop()
-        finally:
-            shutil.rmtree(self.directory, ignore_errors=True)
 
 
 class NatsKey:

@@ -7,7 +7,7 @@ import statistics
 import time
 import unittest
 
-from harness import Service, wait_for
+from harness import Service, start_session, wait_for
 from nats import SilentServer, free_ports
 
 MESSAGES = 300
@@ -38,13 +38,6 @@ class AbsentLinkTest(unittest.TestCase):
         self.addCleanup(service.__exit__, None, None, None)
         return service.start()
 
-    def start_session(self, service):
-        client = service.client()
-        self.addCleanup(client.close)
-        client.create(REPORTER)
-        client.start_later(REPORTER)
-        return client
-
     @staticmethod
     def latencies(*clients):
         """The seconds until the answers to numbered messages for the started session, by client.
@@ -61,7 +54,7 @@ class AbsentLinkTest(unittest.TestCase):
 
     def assert_nobody_notices(self, service, client):
         usual = self.service(link("local"))
-        taken, expected = self.latencies(client, self.start_session(usual))
+        taken, expected = self.latencies(client, start_session(self, usual, REPORTER))
 
         print(f"\nmedian of an answer {statistics.median(taken) * 1e6:.0f} us, "
               f"with a back-end {statistics.median(expected) * 1e6:.0f} us, "
@@ -83,7 +76,7 @@ class AbsentLinkTest(unittest.TestCase):
 
     def assert_session_fails(self, config):
         service = self.service(config)
-        client = self.start_session(service)
+        client = start_session(self, service, REPORTER)
 
         self.assert_nobody_notices(service, client)
         wait_for("the discovery to fail", lambda: FAILED in service.log())

@@ -148,6 +148,14 @@ class DeliveryTest(NatsTest):
 
 
 class FailureTest(NatsTest):
+    @staticmethod
+    def lose_the_server_after_ten_messages(server, driver):
+        driver.start(1)
+        driver.found(1)
+        driver.send(1, 10)
+        driver.flush(1)
+        server.kill()
+
     def test_no_server_at_the_address_is_reported_soon_and_tried_again(self):
         port = free_ports(1)[0]
         with Driver(f"nats://127.0.0.1:{port}") as driver:
@@ -201,11 +209,7 @@ class FailureTest(NatsTest):
 
     def test_messages_wait_for_a_server_that_comes_back(self):
         with Server() as server, Driver(server.url) as driver:
-            driver.start(1)
-            driver.found(1)
-            driver.send(1, 10)
-            driver.flush(1)
-            server.kill()
+            self.lose_the_server_after_ten_messages(server, driver)
             taken, refused, _ = driver.send(1, 100, 10)
             server.start()
             driver.wait_until_acknowledged(110)
@@ -220,11 +224,7 @@ class FailureTest(NatsTest):
 
     def test_a_stream_that_is_missing_when_its_server_returns_is_created_again(self):
         with Server() as server, Driver(server.url) as driver:
-            driver.start(1)
-            driver.found(1)
-            driver.send(1, 10)
-            driver.flush(1)
-            server.kill()
+            self.lose_the_server_after_ten_messages(server, driver)
             server.lose_files()
             driver.send(1, 100, 10)
             server.start()

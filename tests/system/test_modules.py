@@ -9,7 +9,7 @@ import unittest
 from pathlib import Path
 
 import harness
-from harness import BIN, SERVICE, Service, WITH_US, wait_for
+from harness import BIN, SERVICE, Service, WITH_US, start_session, wait_for
 
 EX_CONFIG = 78
 REPORTER = 7
@@ -48,13 +48,6 @@ class ModulesTest(unittest.TestCase):
         if not (BIN / module).exists():
             self.skipTest(f"{module} is not in this build")
 
-    def start_session(self, service):
-        client = service.client()
-        self.addCleanup(client.close)
-        client.create(REPORTER)
-        client.start_later(REPORTER)
-        return client
-
     def test_a_service_in_default_configuration_maps_no_optional_library(self):
         service = self.service().start()
 
@@ -92,7 +85,7 @@ class ModulesTest(unittest.TestCase):
         service = self.service().start()
         self.assertEqual(heavy(service), [])
 
-        self.start_session(service)
+        start_session(self, service, REPORTER)
 
         wait_for("PipeWire's library", lambda: heavy(service) == ["libpipewire", PIPEWIRE])
         self.assertNotIn("did not answer within", service.log())
@@ -110,7 +103,7 @@ class ModulesTest(unittest.TestCase):
     def test_pipewire_is_not_loaded_when_its_counters_are_switched_off(self):
         service = self.service("[drivers]\npipewire = false\n").start()
 
-        client = self.start_session(service)
+        client = start_session(self, service, REPORTER)
         client.send({"number": 1}, reporters=[REPORTER])
         service.wait_for_events(2)
 

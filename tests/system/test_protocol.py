@@ -23,6 +23,13 @@ class ProtocolTests:
 
     service: Service
 
+    @classmethod
+    def use(cls, service):
+        """All tests of the class use this service, which ends after them."""
+        cls.service = service
+        cls.addClassCleanup(shutil.rmtree, service.directory, True)
+        cls.addClassCleanup(service.stop)
+
     def client(self):
         client = self.connect()
         self.addCleanup(client.close)
@@ -183,9 +190,11 @@ def service_process(service):
 class OverTheSocket(ProtocolTests, unittest.TestCase):
     @classmethod
     def setUpClass(cls):
-        cls.service = Service().start()
-        cls.addClassCleanup(shutil.rmtree, cls.service.directory, True)
-        cls.addClassCleanup(cls.service.stop)
+        cls.use(cls.make_service())
+
+    @staticmethod
+    def make_service():
+        return Service().start()
 
     def connect(self):
         return Client.to_socket(self.service.address)
@@ -194,7 +203,7 @@ class OverTheSocket(ProtocolTests, unittest.TestCase):
         return self.service.address
 
     def fresh(self):
-        return Fresh()
+        return Fresh(self.make_service)
 
 
 class OverAPrivateBus(ProtocolTests, unittest.TestCase):
@@ -202,9 +211,7 @@ class OverAPrivateBus(ProtocolTests, unittest.TestCase):
     def setUpClass(cls):
         harness.require("dbus-daemon")
         cls.address = cls.enterClassContextCompat(harness.private_bus())
-        cls.service = Service(bus="session", environment={"DBUS_SESSION_BUS_ADDRESS": cls.address}).start()
-        cls.addClassCleanup(shutil.rmtree, cls.service.directory, True)
-        cls.addClassCleanup(cls.service.stop)
+        cls.use(Service(bus="session", environment={"DBUS_SESSION_BUS_ADDRESS": cls.address}).start())
 
     @classmethod
     def enterClassContextCompat(cls, manager):
@@ -222,41 +229,30 @@ class OverAPrivateBus(ProtocolTests, unittest.TestCase):
         return FreshOnBus()
 
 
-class ThroughSocketActivation(ProtocolTests, unittest.TestCase):
+class ThroughSocketActivation(OverTheSocket):
     @classmethod
     def setUpClass(cls):
         harness.require("systemd-socket-activate")
-        cls.service = activated()
-        cls.addClassCleanup(shutil.rmtree, cls.service.directory, True)
-        cls.addClassCleanup(cls.service.stop)
+        super().setUpClass()
 
-    def connect(self):
-        return Client.to_socket(self.service.address)
-
-    def child_address(self):
-        return self.service.address
-
-    def fresh(self):
-        return Fresh(activated)
-
-
-def activated():
-    """The service started by systemd's activation tool at the first connection."""
-    directory = Path(tempfile.mkdtemp(prefix="halvox-test-"))
-    service = Service(directory=directory, command=[
-        "systemd-socket-activate", f"--listen={directory / 'reporting.sock'}",
-        "--setenv=HALVOX_CONFIG", "--setenv=XDG_RUNTIME_DIR", "--setenv=XDG_STATE_HOME",
-        str(harness.SERVICE)])
-    service.start(wait=False)
-    # The file exists before anyone listens on it. The tool prints a line when it does.
-    wait_for("the activation socket", lambda: "Listening on" in service.log())
-    return service
+    @staticmethod
+    def make_service():
+        """The service started by systemd's activation tool at the first connection."""
+        directory = Path(tempfile.mkdtemp(prefix="halvox-test-"))
+        service = Service(directory=directory, command=[
+            "systemd-socket-activate", f"--listen={directory / 'reporting.sock'}",
+            "--setenv=HALVOX_CONFIG", "--setenv=XDG_RUNTIME_DIR", "--setenv=XDG_STATE_HOME",
+            str(harness.SERVICE)])
+        service.start(wait=False)
+        # The file exists before anyone listens on it. The tool prints a line when it does.
+        wait_for("the activation socket", lambda: "Listening on" in service.log())
+        return service
 
 
 class Fresh:
     """A service that a single test may end."""
 
-    def __init__(self, make=lambda: Service().start()):
+    def __init__(self, make):
         self._make = make
 
     def __enter__(self):

@@ -164,17 +164,22 @@ class TextfileStatisticsTest(unittest.TestCase):
 
         self.assertEqual(self.end_session(), {"level": 1})
 
+    def report_of_a_session_whose_file_is_written_again(self, value, while_deleted=lambda: None):
+        """The file is deleted during the session, and then written with the value."""
+        self.write("level", counter("level", 100))
+        self.start_service()
+        self.start_session()
+        self.delete("level")
+        while_deleted()
+        self.write("level", counter("level", value))
+        return self.end_session()
+
     def test_a_file_that_is_deleted_and_written_again_is_not_reported_in_that_session(self):
         for value in (40, 140):
             with self.subTest(value):
-                self.write("level", counter("level", 100))
-                self.start_service()
-                self.start_session()
-                self.delete("level")
-                # Its start reads the drivers, but without the file.
-                self.start_session(2)
-                self.write("level", counter("level", value))
-                self.assertEqual(self.end_session(), {})
+                # The start of the second session reads the drivers, but without the file.
+                self.assertEqual(self.report_of_a_session_whose_file_is_written_again(
+                    value, while_deleted=lambda: self.start_session(2)), {})
 
                 self.start_session()
                 self.write("level", counter("level", value + 2))
@@ -184,12 +189,7 @@ class TextfileStatisticsTest(unittest.TestCase):
     def test_a_file_that_is_deleted_and_written_again_unseen_is_not_reported_in_that_session(self):
         for value in (40, 140):
             with self.subTest(value):
-                self.write("level", counter("level", 100))
-                self.start_service()
-                self.start_session()
-                self.delete("level")
-                self.write("level", counter("level", value))
-                self.assertEqual(self.end_session(), {})
+                self.assertEqual(self.report_of_a_session_whose_file_is_written_again(value), {})
                 self.reports = 0
 
     def test_sessions_of_milliseconds_each_report_what_was_counted_and_nothing_else(self):
