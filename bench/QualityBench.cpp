@@ -39,7 +39,7 @@ void work(std::chrono::microseconds time) {
   }
 }
 
-// Queues that always have a next job, as long as it lives.
+// Gives its queues a next job after each job, until it is destroyed.
 class Flood {
  public:
   Flood(DispatchService& service, QualityOfService quality) {

@@ -83,8 +83,8 @@ endfunction()
 # halvox_module(<file> SOURCES <files> [PARTS <targets>] [DEPENDS <targets>])
 # A library of that file name which the programs load when they need it, beside them in the build and
 # in the library directory when installed. It holds its sources and the objects of PARTS. What these
-# use of our other libraries is not linked again but found in the program, so that nothing that must
-# exist once in a process, such as the installed services, is there twice.
+# use of our other libraries is not linked again: the module finds it in the program. State that must
+# exist once in a process, such as the installed services, therefore exists once.
 function(halvox_module file)
   cmake_parse_arguments(ARG "" "" "SOURCES;PARTS;DEPENDS" ${ARGN})
   list(TRANSFORM ARG_PARTS REPLACE "(.+)" "$<TARGET_OBJECTS:\\1>" OUTPUT_VARIABLE objects)

@@ -38,7 +38,7 @@ struct ToolStreams {
   std::istream& input;
   std::ostream& output;
   std::ostream& errors;
-  int outputDescriptor = -1;  // the descriptor behind `output`; -1 if it has none
+  int outputDescriptor = -1;  // the descriptor of `output`; -1 if it has none
   bool isInputTerminal = false;
 };
 

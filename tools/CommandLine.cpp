@@ -102,7 +102,8 @@ std::vector<const CLI::App*> chosenOf(const CLI::App& app) {
   return chosen;
 }
 
-// Returns "halvoxctl trace show" as far as the command was given, without the program in a script.
+// Returns the names of the program and of the given commands, such as "halvoxctl trace show"; in a
+// script without the program.
 std::string nameOf(const CLI::App& app, const std::vector<const CLI::App*>& chosen) {
   std::string name = app.get_name();
   for (const CLI::App* command : chosen) {

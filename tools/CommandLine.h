@@ -15,7 +15,7 @@ namespace halvox::tools {
 struct CommandLineText {
   ExitStatus status = ExitStatus::kDone;
   std::string text;
-  // For an error: the command, as far as it was given, and the reason without it.
+  // For an error: the given command, empty if it was not recognised, and the reason without it.
   std::string command{};
   std::string reason{};
 };

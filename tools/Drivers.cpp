@@ -167,7 +167,7 @@ class DriverPrinter {
     out_.flush();
   }
 
-  // Ends when nobody reads the output any more.
+  // Ends when the output is closed.
   void watch(std::chrono::milliseconds interval, int outputDescriptor) {
     using Clock = std::chrono::steady_clock;
     auto before = sample();

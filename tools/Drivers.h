@@ -23,7 +23,7 @@ std::string formatChannel(const platform::IOReportChannel& channel, std::optiona
 
 // Prints the current driver channels with their values, read from the sources that the
 // configuration names. With --watch, prints their changes per second until the output is closed.
-// `outputDescriptor` is the descriptor behind `out`. Does not need the service.
+// `outputDescriptor` is the descriptor of `out`. Does not need the service.
 ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream& out,
                        int outputDescriptor, std::ostream& errors);
 

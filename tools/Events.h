@@ -14,9 +14,9 @@ namespace halvox::tools {
 // that could control a terminal.
 std::string formatEvent(const platform::linux_::StoredEvent& event, OutputForm form);
 
-// Prints the selected events, newest last. With --follow, goes on with new events until the output
-// is closed or the directory of the store is deleted. `outputDescriptor` is the descriptor behind
-// `out`.
+// Prints the selected events, newest last. With --follow, continues with new events until the
+// output is closed or the directory of the store is deleted. `outputDescriptor` is the descriptor
+// of `out`.
 ExitStatus showEvents(const RecordSelection& request, OutputForm form, std::ostream& out,
                       int outputDescriptor, std::ostream& errors);
 

@@ -26,7 +26,7 @@ using platform::linux_::readPreferenceText;
 using platform::linux_::Result;
 using platform::linux_::UniqueFd;
 
-// Readable by everyone, as far as the umask allows.
+// Readable by everyone, unless the umask forbids it.
 constexpr mode_t kModeOfNewFiles = 0644;
 
 Failure<> failure(const std::filesystem::path& path, int error) {

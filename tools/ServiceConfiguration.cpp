@@ -36,7 +36,7 @@ StoreSearch searchStore() {
   for (const auto& directory : {search.directory, platform::linux_::systemStorageDirectory()}) {
     const auto database = directory / kDatabaseName;
     struct stat status {};
-    // A store that this user may not look at counts as present.
+    // A store that this user may not read counts as present: the error then names it.
     if (::stat(database.c_str(), &status) == 0 || !client::meansAbsence(errno)) {
       search.directory = directory;
       search.isThere = true;

@@ -42,7 +42,7 @@ ExitStatus cannotRead(const StoreRun& run, const StoreError& error) {
                                                                error.description, "no-store");
 }
 
-// Waits for the next records. Returns false when nobody reads the output any more.
+// Waits for the next records. Returns false when the output is closed.
 bool waitForRecords(int storeDescriptor, int outputDescriptor) {
   // The output is polled for errors only: while no records come, a pipe without a reader shows in
   // no other way.

@@ -29,7 +29,7 @@ struct StoreRun {
   OutputForm form;      // of error messages
   const RecordSelection& selection;
   std::ostream& out;
-  int outputDescriptor;  // the descriptor behind `out`
+  int outputDescriptor;  // the descriptor of `out`
   std::ostream& errors;
 };
 

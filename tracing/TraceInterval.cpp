@@ -76,7 +76,7 @@ void TraceInterval::processTracepointsAnyThread(const Session& session, const Ev
       } else {
         addInterval(session, start, event.timestamp);
       }
-      // Cleared even if there was no start; a tick of 0 cannot be told from none. Both are
+      // Cleared even if there was no start; a tick of 0 is the same as none. Both are
       // required.
       start = kNoStart;
     }

@@ -41,7 +41,7 @@ halvox_wait_for_start() {
       return 1
     fi
     if ((SECONDS > end)); then
-      printf '%s\n' "$HALVOX_SCRIPT: waited $seconds s in vain for $what" >&2
+      printf '%s\n' "$HALVOX_SCRIPT: timed out after $seconds s waiting for $what" >&2
       return 1
     fi
     sleep 0.05
@@ -149,7 +149,7 @@ halvox_progress_in() {
 # the command fails, prints the end of its output and returns its status. The log is temporary.
 halvox_run() {
   # shellcheck disable=SC1003  # a backslash, not a quote
-  local what=$1 log=$2 pid status=0 begin=$SECONDS told=0 ticks=0 spinner='|/-\'
+  local what=$1 log=$2 pid status=0 begin=$SECONDS shown=0 ticks=0 spinner='|/-\'
   shift 2
   : >"$log"
   halvox_start "$what" "$log" "$@"
@@ -158,9 +158,9 @@ halvox_run() {
     if [ -t 1 ]; then
       printf '\r%s %s %s %d s\033[K' "${spinner:ticks++%4:1}" "$what" \
         "$(halvox_progress_in "$log")" $((SECONDS - begin))
-    elif ((SECONDS - begin >= told + 10)); then
-      told=$((SECONDS - begin))
-      say "$what $(halvox_progress_in "$log") $told s"
+    elif ((SECONDS - begin >= shown + 10)); then
+      shown=$((SECONDS - begin))
+      say "$what $(halvox_progress_in "$log") $shown s"
     fi
     sleep 0.1
   done

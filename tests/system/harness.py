@@ -51,7 +51,7 @@ def wait_for(what, condition, deadline=DEADLINE, pause=0.01):
         if value:
             return value
         if time.monotonic() > end:
-            raise AssertionError(f"waited {deadline:.0f} s in vain for {what}")
+            raise AssertionError(f"timed out after {deadline:.0f} s waiting for {what}")
         time.sleep(pause)
 
 
@@ -308,7 +308,7 @@ class Client:
         return values[0] if len(values) == 1 else values or None
 
     def call_later(self, member, signature="", *arguments):
-        """Sends one request. The caller looks at its answer later."""
+        """Sends one request. The caller reads its answer later."""
         pending = Pending()
         self.connection.call(
             self._destination, OBJECT, INTERFACE, member,
@@ -382,7 +382,7 @@ def iterate_until(what, condition, deadline=DEADLINE):
     end = time.monotonic() + deadline
     while not condition():
         if time.monotonic() > end:
-            raise AssertionError(f"waited {deadline:.0f} s in vain for {what}")
+            raise AssertionError(f"timed out after {deadline:.0f} s waiting for {what}")
         if not context.iteration(False):
             time.sleep(0.002)
 

@@ -109,7 +109,7 @@ class WantedTest(MessagesTest):
         client.stop(7)
         self.assertEqual(self.values_through_link(service),
                          [(PLAYBACK, START, 1), (PLAYBACK, STOP, 2), (VOLUME, START, 3)])
-        service.stop()  # no message is on its way any more
+        service.stop()  # delivers the messages that are still on their way
         return [name for name, _ in service.events()]
 
     def test_all_events_are_recorded_when_all_are_wanted(self):

@@ -229,7 +229,7 @@ class KernelTraceTest(unittest.TestCase):
                 self.assertNotEqual(service.daemon(), daemon)
                 service.run_client("intervals", 1)
             wait_for("the new results", lambda: "Own0" in service.results()["values"])
-            # Nobody needs to wait for the first one any more.
+            # The first one has already ended.
             self.assertFalse(Path(f"/proc/{daemon}").exists())
 
     def test_million_events_are_read_back_without_loss(self):
