@@ -67,7 +67,7 @@ class AbsentLinkTest(unittest.TestCase):
     def assert_dropped_by_the_link_alone(self, service, client):
         self.assertIs(client.stop(REPORTER), True)
         # The summary of the session is an additional message.
-        counted = wait_for("the link to drop all", lambda: (
+        counted = wait_for("the link to drop all messages", lambda: (
             now := counters(service, "link"))["dropped: no back-end"] == MESSAGES + 1 and now)
         self.assertEqual(counted["received"], MESSAGES + 1)
         self.assertEqual(counted["sent"] + counted["failed"], 0)
