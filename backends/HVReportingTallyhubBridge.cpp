@@ -39,6 +39,8 @@ class EventName {
 
 Dictionary makePayload(const Message& message, const HVReportingSession& session) {
   static const Key key("HostApplicationDisplayID");
+  // A copy shares the message's entries until it is changed: every bridge and session has the same
+  // message.
   Dictionary payload = message.value_or(Dictionary{});
   // Replaces what the message itself has under this key: only the session's configuration counts.
   // This is required.

@@ -11,6 +11,7 @@ using platform::Value;
 platform::Value HVReportingUtilityRetrieveAppName(const Dictionary& dictionary) {
   static const Key key("HostApplicationDisplayID");
   const Value* name = dictionary.find(key);
+  // Any kind of value is returned unchanged: clients may put a number there.
   return name == nullptr ? Value("Unknown") : *name;
 }
 

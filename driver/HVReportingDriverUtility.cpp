@@ -61,6 +61,7 @@ IOReportService::Samples createSamples(const HVReportingIOChannelSubscription& s
 IOReportService::Samples createDelta(const DriverSnapShot& snapShot, const std::string& description,
                                      const IOReportService::Samples& current) {
   const auto found = snapShot.find(description);
+  // Null if the group could not be sampled at the start. There is no difference then.
   const IOReportService::Samples previous = found == snapShot.end() ? nullptr : found->second;
   std::optional<IOReportError> error;
   auto delta = platform::ioReport().IOReportCreateSamplesDelta(previous, current, error);

@@ -21,7 +21,8 @@ namespace {
 using WeakClient = std::weak_ptr<HVReportingClientServerInstance>;
 
 constexpr std::string_view kUptimeEvent = "com.tarno.halvox.hvreportingclientuptime";
-// Reported for a client that was never registered.
+// Reported for a client that was never registered. An integer, while known uptimes are doubles;
+// this is required.
 constexpr std::int64_t kUnknownUptime = -1;
 
 void handleConnectionError(const WeakClient& weakClient) {
@@ -182,6 +183,7 @@ std::shared_ptr<HVReportingSession> HVReportingServiceDelegate::findReportingSes
 }
 
 void HVReportingServiceDelegate::removeClient(const HVReportingClientServerInstance& client) {
+  // The index first: erasing the client from the list may release it.
   index_.removeClient(client, sessionsOf(client));
   std::erase_if(clients_, [&client](const Client& one) { return one.get() == &client; });
 }

@@ -60,6 +60,7 @@ std::string listDomains() {
 std::optional<client::Category> parseNumberInDomain(std::string_view text) {
   const auto separator = text.find('_');
   if (separator == std::string_view::npos) return std::nullopt;
+  // Domains are found only together with a category. "Undefined" is category 0 and adds no bits.
   const auto domain = client::findCategory(std::string(text.substr(0, separator)) + "_Undefined");
   const auto number = parseWhole<std::uint16_t>(text.substr(separator + 1));
   if (!domain || !number) return std::nullopt;

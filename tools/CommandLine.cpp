@@ -153,6 +153,8 @@ std::string listCommands(const CLI::App& app) {
 
 // Returns what is wrong: the library's message, or our own if a command is missing or unknown.
 std::string reasonOf(const CLI::ParseError& error, const CLI::App& app, const CLI::App& command) {
+  // The library answers a missing and an unknown sub-command alike, with "A subcommand is
+  // required", and names neither.
   const bool isWithoutCommand = dynamic_cast<const CLI::RequiredError*>(&error) != nullptr &&
                                 command.get_require_subcommand_min() > 0 &&
                                 command.get_subcommands().empty();
@@ -172,6 +174,7 @@ CommandLineText describe(const CLI::ParseError& error, const CLI::App& app, Comm
   const std::string reason = reasonOf(error, app, chosen.empty() ? app : *chosen.back());
   std::string text = prefix.empty() ? "" : prefix + ": ";
   text += reason + '\n';
+  // The prefix of a script's line is its file and number, which is not a command to try.
   if (source == CommandSource::kArguments) text += "Try '" + prefix + " --help'.\n";
   std::string command;
   for (const CLI::App* part : chosen) command += (command.empty() ? "" : " ") + part->get_name();

@@ -26,6 +26,7 @@ CLI::App& CommandSet::addBelow(CLI::App& parent, const CommandText& text) {
 
 void CommandSet::addCommonOptions(CLI::App& app, CommandReach reach) {
   app.add_flag("--json", options_.json, "Print JSON, one object on each line");
+  // All lines of a script share the connection of the script.
   if (source_ == CommandSource::kScriptLine) return;
   auto* socket = app.add_option("--socket", options_.socket,
                                 "The service's socket (default: $HALVOX_SOCKET, else what the "

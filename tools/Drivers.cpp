@@ -31,6 +31,7 @@ class ErrorLog final : public platform::LogCategory {
   ErrorLog() : LogCategory(platform::LogLevel::kError) {}
   void write(platform::LogLevel /*level*/, std::string_view line) override {
     constexpr std::size_t kPrefix = 32;  // the unit and its line
+    // Sources log on threads of their own.
     const std::lock_guard lock(mutex_);
     std::cerr << "halvoxctl drivers: " << harmlessText(line.substr(std::min(kPrefix, line.size())))
               << std::endl;
@@ -243,6 +244,7 @@ ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream
   service.open();
   DriverPrinter printer(service, request, form, out);
   if (!request.group.empty() && !printer.hasChannels()) {
+    // An empty output would look as if the group had no counts.
     return complain(ExitStatus::kRefused, "nothing to show: there is no group \"" + request.group +
                                               "\"; " + groupsOf(service));
   }

@@ -51,6 +51,7 @@ std::string quotedText(std::string_view text) {
 }
 
 std::string keyText(std::string_view key) {
+  // Other keys need quotes. A dot, for example, would make tables of the parts.
   const bool isBare = !key.empty() && std::ranges::all_of(key, [](char letter) {
     return (letter >= 'a' && letter <= 'z') || (letter >= 'A' && letter <= 'Z') ||
            (letter >= '0' && letter <= '9') || letter == '-' || letter == '_';
@@ -209,6 +210,7 @@ Edited withoutPreference(std::string_view text, std::string_view key,
   const std::size_t place = parsed.root().find(key)->first.source().begin
                                 ? offsetOf(text, parsed.root().find(key)->first.source().begin)
                                 : parsed.begin(*old);
+  // Whole lines: a comment beside the value belongs to it and is removed too.
   std::string edited(text.substr(0, lineStart(text, place)));
   edited += text.substr(lineEnd(text, parsed.end(*old)));
   return verified(std::move(edited), expected, parsed, key, file);

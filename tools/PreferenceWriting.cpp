@@ -118,6 +118,8 @@ Result<void> changePreferenceFile(const std::filesystem::path& named, const Pref
   std::error_code error;
   std::filesystem::create_directories(directory, error);
   if (error) return failure(directory, error.value());
+  // The directory is locked and not the file. The change replaces the file, and a lock on the old
+  // one would keep nobody from changing the new one.
   const UniqueFd held(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (!held) return failure(directory, errno);
   if (!lock(held.get(), patience)) {
@@ -133,6 +135,7 @@ Result<void> changePreferenceFile(const std::filesystem::path& named, const Pref
   const std::string before = old.has_value() ? old->text : std::string();
   auto edited = edit(before, file);
   if (!edited) return std::move(edited).error();
+  // A file that is replaced by itself would wake the service for nothing.
   if (*edited == before) return {};
   return replace(file, *edited, old.has_value() ? old->mode : modeOfNewFile(), held.get());
 }

@@ -17,6 +17,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
+// Relative, because it is below the storage root of the service.
 constexpr const char* kDirectory =
     "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
 

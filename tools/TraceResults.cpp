@@ -127,6 +127,7 @@ void writeTraceEvents(const TraceResults& results, std::ostream& out) {
   json.String("ns");
   json.Key("traceEvents");
   json.StartArray();
+  // Viewers group tracks by process; the file has one.
   writeName(json, 0, results.product);
   int track = 0;
   for (const auto& [name, values] : results.values) {

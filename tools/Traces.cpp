@@ -124,6 +124,7 @@ ParamsFindings checkParams(const std::string& file) {
   ParamsListener listener(found.reasons);
   const platform::linux_::PlistPropertyListService lists;
   const TraceParams params = TraceParamsParser(file).loadTraceParams(lists, listener);
+  // The service answers such a session like any other and leaves an empty result.
   if (params.type == TraceType::kSignpost) {
     found.reasons.emplace_back("its TraceType is OSSignpost, of which nothing is recorded");
     return found;
@@ -258,7 +259,10 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
   if (const auto* status = std::get_if<ExitStatus>(&loaded)) return *status;
   const auto& configuration = std::get<platform::linux_::Configuration>(loaded);
   const fs::path results = configuration.storage.root / kResultsFile;
+  // The service has another working directory.
   const std::string params = fs::absolute(request.params).string();
+  // The service reports mistakes in this file only in its own log. Reading it here shows them to
+  // the user, before the program runs.
   const ParamsFindings found = checkParams(params);
   const bool isUsable = found.intervals > 0;
   for (const std::string& reason : found.reasons) {

@@ -138,6 +138,7 @@ void TraceRunner::createTraceFromTraceParams(const TraceParams* params) {
 }
 
 void TraceRunner::runTraces() {
+  // A second recording would add to the results of the first.
   if (state_ != State::kMade) return;
   state_ = State::kRecording;
   kLog.info("Number of traces to perform: ", recordings_.size());
@@ -148,6 +149,7 @@ void TraceRunner::runTraces() {
     kLog.info("Setting up tracing: ", trace.name());
     recording->setupTracing();
     kLog.info("Starting tracing: ", trace.name());
+    // Subscribed before the start, which begins to deliver at once.
     recording->subscribe();
     // On the queue, because the tracer may take seconds to start and every client waits for the
     // thread that starts sessions.

@@ -131,6 +131,7 @@ void LoadClient::createSessions(std::int64_t first, std::int64_t count) {
 
 void LoadClient::sendOne(std::int64_t number, const MessageShape& shape) {
   const Message message = newSendMessage(bus_, reporter_, number, shape);
+  // Without a time-out: a slow answer is to be measured.
   check(sd_bus_call_async(bus_, nullptr, message.get(), countAnswer, &answered_, UINT64_MAX),
         "send");
 }

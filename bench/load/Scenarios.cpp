@@ -65,6 +65,7 @@ std::vector<double> pingUnderLoad(const Server& server, const LoadOptions& optio
   for (int number = 0; number < options.clients; ++number) {
     busy.emplace_back([&server, &options, &stopping, number] {
       MessageShape repeated = options.shape;
+      // Repeated, so that no history grows while the other client is measured.
       repeated.content = Content::kRepeated;
       const auto client = server.client(100 + number);
       while (!stopping) client->pipeline(1000, options.window, repeated);

@@ -209,6 +209,8 @@ void StreamSession::sendXrun(XrunMeter::Seconds lost) {
 void StreamSession::sendRun(EventType type) { send({{kRunKey, run_}}, category(), type); }
 
 void StreamSession::send(platform::Dictionary message, Category category, EventType type) {
+  // An event in the store has the application but not the session: the serial distinguishes its
+  // streams.
   message.set(kSerialKey, identity_.serial);
   client_.send(identity_.reporterID, message, category, type);
 }

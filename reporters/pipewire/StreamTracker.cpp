@@ -125,6 +125,8 @@ void StreamTracker::addStream(const Node& node, Direction direction) {
   // The server uses an ID again only after it removed the object, even if no removal was received.
   removeStream(node.id);
   const ReporterID reporterID = reporterIDFor(cookie_, node.serial);
+  // Any client of PipeWire can create streams without limit. Equal identifiers are possible,
+  // because an identifier has only the lower 32 bits of a serial.
   if (streams_.size() >= kMaxStreams || !reporterIDs_.insert(reporterID).second) {
     ++refusedStreams_;
     return;

@@ -75,6 +75,7 @@ std::optional<double> StreamVolume::effective() const {
     return 0.0;
   }
   const float product = std::min(volume_.value_or(1) * loudest_.value_or(1), kLoudest);
+  // A product of two floats has noise in its last digits, which is not a change of the volume.
   return std::round(static_cast<double>(product) * kVolumeSteps) / kVolumeSteps;
 }
 

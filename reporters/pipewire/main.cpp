@@ -21,6 +21,7 @@ namespace {
 
 using namespace halvox::pipewire_reporter;  // the program's own
 
+// Wrong arguments as in halvoxctl, the others as in sysexits.h.
 constexpr int kExitUsage = 2;
 constexpr int kExitSoftware = 70;
 constexpr int kExitConfiguration = 78;
