@@ -74,7 +74,7 @@ struct TLMReportingMessage {
 // the service. The spelling of the functions is part of the interface.
 class TLMReportingService {
  public:
-  // The back-ends that were found; none if there are none.
+  // Called with the back-ends that were found, or with std::nullopt if none was.
   using BackendsCallback = std::function<void(const std::optional<Array>&)>;
   using Token = std::shared_ptr<const TLMSecureHierarchyToken>;
   using Session = std::shared_ptr<TLMReportingSession>;

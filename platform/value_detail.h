@@ -1,6 +1,6 @@
 #pragma once
 
-// The shared nodes behind values. Only the sources of value.h include this header.
+// The shared nodes that values refer to. Only the sources of value.h include this header.
 //
 // Each node begins with its reference count, and its content follows the struct in the same block
 // of memory: one allocation for each node, and one cache miss less than with a pointer to the

@@ -157,6 +157,8 @@ Result<ChildProcess, int> ChildProcess::start(const ChildProgram& program) {
   const std::vector<char*> variables =
       program.environment ? pointersTo(*program.environment) : std::vector<char*>();
   pid_t pid = 0;
+  // posix_spawn() instead of fork(): between fork() and exec(), a program with threads may call
+  // hardly any function.
   const int error =
       ::posix_spawnp(&pid, arguments.front(), actions.get(), attributes.get(), arguments.data(),
                      program.environment ? variables.data() : environ);

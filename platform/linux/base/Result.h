@@ -35,8 +35,8 @@ class [[nodiscard]] Result {
  public:
   using Error = Failure<Code>;
 
-  // Implicit, so that a function returns either by its own name. What converts to a value does so
-  // here too: std::nullopt where the value is a std::optional.
+  // Implicit, so that a function returns its value or its error as it is. Also takes what converts
+  // to a value, such as std::nullopt where the value is a std::optional.
   template <typename Source = Value>
   requires(std::is_convertible_v<Source, Value> &&
            !std::is_same_v<std::remove_cvref_t<Source>, Result> &&

@@ -149,6 +149,7 @@ std::size_t appendEscaped(std::string& line, std::string_view text, std::size_t 
   while (taken < text.size()) {
     const std::string_view rest = text.substr(taken);
     const auto end = std::ranges::find_if_not(rest, isPlain);
+    // Appended as one run: nearly all texts have nothing else.
     if (const auto plain = static_cast<std::size_t>(end - rest.begin()); plain > 0) {
       const std::size_t fitting = std::min(plain, room);
       line += rest.substr(0, fitting);
@@ -162,6 +163,7 @@ std::size_t appendEscaped(std::string& line, std::string_view text, std::size_t 
         !step.valid ? hexEscape("\\x%02x", static_cast<unsigned char>(rest.front()))
         : isUnprintable(step.character) ? escaped(step.character)
                                         : std::string(rest.substr(0, step.length));
+    // An escape is never cut: half of one would read as something else.
     if (part.size() > room) break;
     line += part;
     room -= part.size();

@@ -85,7 +85,7 @@ FileContent readWholeFile(const FileToRead& file) {
     fail(content, errno);
     return content;
   }
-  // What is there now may be something else than what was looked at.
+  // Looked at again: another file may have taken the name since.
   struct stat status {};
   if (::fstat(descriptor.get(), &status) != 0) {
     fail(content, errno);

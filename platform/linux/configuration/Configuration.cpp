@@ -269,6 +269,7 @@ std::variant<Configuration, ConfigurationError> parse(const std::string& file,
   TableReader root(&parsed.table(), "", mistakes);
   readListener(root.table("listener"), configuration.listener);
   readStorage(root.table("storage"), configuration.storage);
+  // Before the tables that may replace them, and after the storage, whose directory they are in.
   setDefaultDirectories(configuration);
   readDirectory(root.table("preferences"), configuration.preferencesDirectory);
   readDirectory(root.table("notify"), configuration.notifyDirectory);
@@ -307,7 +308,6 @@ Configuration defaultConfiguration(const DefaultPlaces& places) {
   configuration.listener.mode = defaultMode(configuration.listener);
   configuration.storage.directory = places.storageDirectory;
   configuration.storage.root = configuration.storage.directory / "root";
-  // Before the tables that may replace them, and after the storage, whose directory they are in.
   setDefaultDirectories(configuration);
   return configuration;
 }
@@ -318,7 +318,7 @@ std::variant<Configuration, ConfigurationError> loadConfiguration(const DefaultP
   if (auto* error = std::get_if<ConfigurationError>(&content)) return std::move(*error);
   const auto& text = std::get<std::optional<std::string>>(content);
   if (text.has_value()) return parse(file.native(), *text, places);
-  // Whoever names a file wants that file. A default place may be empty.
+  // A file that the user has named must exist. A default place may be empty.
   if (configurationVariable() != nullptr) return unreadable(file, ENOENT);
   return defaultConfiguration(places);
 }

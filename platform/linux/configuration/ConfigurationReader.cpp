@@ -168,6 +168,8 @@ void TableReader::read(std::string_view key, NumberRange range, std::uint64_t& r
   const toml::node* node = find(key);
   if (node == nullptr) return;
   const auto* number = node->as_integer();
+  // TOML's integers are signed and the range is not. A plain comparison would take -1 for a large
+  // number.
   if (number == nullptr || std::cmp_less(number->get(), range.least) ||
       std::cmp_greater(number->get(), range.greatest)) {
     return expected(*node, key,

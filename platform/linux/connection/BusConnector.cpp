@@ -105,6 +105,7 @@ BusConnector::Failure BusConnector::authenticate() {
       case dbus::HandshakeState::kContinue:
         break;
       case dbus::HandshakeState::kDone:
+        // The last line, BEGIN, must leave before the first message.
         return send(output);
       case dbus::HandshakeState::kFailed:
         return unreachable("the handshake failed: " + progress.error);

@@ -199,6 +199,7 @@ void ConnectionHost::readMail() {
     reply.ticket->deliver(reply.error.get(), reply.value);
   }
   for (const std::shared_ptr<ClientLink>& client : mail_.clientsWithRoom) {
+    // The client may have disconnected since: requests outlive their connection.
     if (client->connection() != nullptr) client->connection()->onRoom();
   }
   if (mail_.relieved) turn_.relieve();

@@ -149,7 +149,7 @@ TEST_F(ProcessTest, ClientsWaitWithoutCostWhenDescriptorsRunOut) {
   EXPECT_EQ(isSpinning(), 0);
   EXPECT_TRUE(staysQuiet(isSpinning, std::chrono::milliseconds(500)));
 
-  // Whoever is served makes room for those that wait; nobody is turned away.
+  // A client that has been served makes room for those that wait; none is turned away.
   for (const auto& client : clients) {
     if (client != clients.front()) {
       EXPECT_TRUE(client->receive().has_value());

@@ -74,6 +74,7 @@ bool SocketStream::close() {
   }
   reading_ = false;
   blocked_ = false;
+  // Before the descriptor is closed: its number can be that of another connection at once.
   updateInterest();
   fd_.reset();
   return true;

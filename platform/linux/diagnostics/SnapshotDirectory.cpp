@@ -143,6 +143,7 @@ std::vector<fs::path> SnapshotDirectory::newestFirst() const {
   for (; !error && at != fs::directory_iterator(); at.increment(error)) {
     const std::string name = at->path().filename().string();
     struct stat status {};
+    // Anything else in the directory was put there by others, and is never deleted.
     if (!isSnapshotName(name) || ::lstat(at->path().c_str(), &status) != 0 ||
         !S_ISREG(status.st_mode)) {
       continue;
@@ -152,6 +153,7 @@ std::vector<fs::path> SnapshotDirectory::newestFirst() const {
                    .modified = status.st_mtim.tv_sec * kNanoseconds + status.st_mtim.tv_nsec,
                    .path = at->path()});
   }
+  // By the time in the name and not by that of the file, which copying or restoring changes.
   std::ranges::sort(all, [](const Named& left, const Named& right) {
     return std::tie(left.stamp, left.modified, left.path) >
            std::tie(right.stamp, right.modified, right.path);

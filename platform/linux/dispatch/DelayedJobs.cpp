@@ -66,6 +66,7 @@ void DelayedJobs::stop() {
   {
     const MutexLock lock(mutex_);
     isStopped_ = true;
+    // Destroyed after the lock is released: what a job holds may add jobs.
     discarded.swap(jobs_);
     asio::error_code ignored;
     timer_.cancel(ignored);

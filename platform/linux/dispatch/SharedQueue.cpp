@@ -80,7 +80,6 @@ void SharedQueue::askForTurn() {
   DispatchThread& thread = DispatchThread::current();
   // A thread of the pool that is woken for each message costs more than the rest of the message.
   if (thread.isHoldingPool()) return thread.noteTurn(shared_from_this());
-  // Back to the end of the run queue, although jobs are left: other queues wait for this thread.
   beginTurn();
 }
 
@@ -96,6 +95,7 @@ void SharedQueue::runTurn() {
     if (pool_->isStopped()) return discardJobs();
     if (!runNext()) return;
   }
+  // Back to the end of the run queue, although jobs are left: other queues wait for this thread.
   beginTurn();
 }
 

@@ -30,8 +30,8 @@ std::optional<std::vector<std::string>> namesOf(std::string_view path) {
   return names;
 }
 
-// Replaces the system's error for a symbolic link in the way. With O_NOFOLLOW and O_DIRECTORY it is
-// "not a directory", which does not help to find the cause.
+// Replaces the system's error for a symbolic link in the path. With O_NOFOLLOW and O_DIRECTORY it
+// is "not a directory", which does not help to find the cause.
 int reasonAt(const UniqueFd& parent, const std::string& name, int systemError) {
   struct stat status {};
   const bool isLink = ::fstatat(parent.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&

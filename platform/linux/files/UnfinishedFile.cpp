@@ -64,6 +64,7 @@ int UnfinishedFile::beginNamed() {
     ownName_.clear();
     return errno;
   }
+  // Until the file is locked, its age keeps other processes from removing it.
   return ::flock(file_.get(), LOCK_EX | LOCK_NB) == 0 ? 0 : errno;
 }
 

@@ -6,6 +6,7 @@
 namespace halvox::pipewire {
 
 bool ServerConnection::connect(pw_properties* properties) {
+  // Static, because the library keeps a pointer to each table.
   static const pw_core_events kCoreEvents = [] {
     pw_core_events events{};
     events.version = PW_VERSION_CORE_EVENTS;

@@ -66,7 +66,7 @@ NotifyStatus InotifyNotifyService::notify_register_dispatch(std::string_view nam
                ": expected a name that a file can have; it will never be posted");
     return kNotifyInvalidName;
   }
-  // Read the state before the thread adopts the registration. The thread compares with it and so
+  // Read the state before the thread adopts the registration. By comparing with it, the thread
   // finds every change from here on, although it does not watch yet.
   SettingBaseline baseline = settings_.look(std::string(name));
   const MutexLock held(mutex_);

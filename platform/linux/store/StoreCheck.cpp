@@ -59,6 +59,7 @@ SqliteCode readSlice(Statement& rows, std::int64_t& last, std::uint64_t& count) 
 }  // namespace
 
 void StoreCheck::begin(const std::string& file, const StoreExtent& extent, OnDamage onDamage) {
+  // A check of a database that was opened before must not report about this one.
   static_cast<void>(stop());
   records_ = 0;
   isChecked_ = false;

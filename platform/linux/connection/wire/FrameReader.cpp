@@ -144,6 +144,7 @@ class FieldReader {
       case HeaderField::kSignature:
         return reader_.readSignature(header_.signature);
       case HeaderField::kUnixFds:
+        // Only noted. The dispatcher refuses a request that has descriptors.
         return reader_.read(header_.unixFds);
     }
     return false;
@@ -243,6 +244,7 @@ std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame) {
   header.flags = byteAt(frame, kFlagsOffset);
   header.bigEndian = byteAt(frame, 0) == 'B';
   header.serial = numberAt(frame, kSerialOffset, header.bigEndian);
+  // D-Bus forbids it: in a reply, 0 would mean that the field is absent.
   if (header.serial == 0) return WireError{"the serial number must not be 0", kSerialOffset};
 
   const std::size_t fieldsBytes = numberAt(frame, kFieldsLengthOffset, header.bigEndian);

@@ -199,12 +199,12 @@ TEST(FrameTest, PaddingThatIsNotZeroIsRefused) {
   // second ends two bytes after the last boundary.
   std::string betweenFields = sound;
   betweenFields[16 + 11] = 'x';
-  std::string behindFields = sound;
-  behindFields.back() = 'x';
+  std::string afterFields = sound;
+  afterFields.back() = 'x';
 
   EXPECT_EQ(errorOf(sound), "");
   EXPECT_NE(errorOf(betweenFields), "");
-  EXPECT_EQ(errorOf(behindFields), "the padding after the header is not zero");
+  EXPECT_EQ(errorOf(afterFields), "the padding after the header is not zero");
 }
 
 TEST(FrameTest, ErrorNamesTheByte) {

@@ -203,6 +203,7 @@ void ClientHandshake::start(std::string& output) const {
 HandshakeProgress ClientHandshake::feed(std::span<const std::byte> input, std::string& output) {
   std::span<const std::byte> rest = input;
   if (state_ == HandshakeState::kContinue) {
+    // One line: a server answers with no more, and what follows belongs to the messages.
     if (line_.take(rest)) {
       onLine(line_.text(), output);
     } else if (line_.isTooLong()) {

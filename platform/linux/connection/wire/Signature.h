@@ -8,7 +8,8 @@
 namespace halvox::platform::linux_::dbus {
 
 inline constexpr std::size_t kMaxSignatureBytes = 255;
-// Of arrays, and of structs and dictionary entries, each, within one signature.
+// How deeply arrays may be nested within one signature. The same number applies to structs and
+// dictionary entries, which are counted apart from arrays.
 inline constexpr unsigned kMaxSignatureNesting = 32;
 
 enum class SignatureShape : std::uint8_t {

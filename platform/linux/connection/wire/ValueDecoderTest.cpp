@@ -197,7 +197,7 @@ TEST(ValueDecoderTest, BrokenBasicValuesAreMalformed) {
   expectMalformed("empty path", "o", WireBytes().text(""));
   expectMalformed("path with a slash too many", "o", WireBytes().text("/a/"));
   expectMalformed("signature against the grammar", "g", WireBytes().signature("a"));
-  expectMalformed("bytes behind the last argument", "y", WireBytes().u8(1).u8(1));
+  expectMalformed("bytes after the last argument", "y", WireBytes().u8(1).u8(1));
   expectMalformed("padding", "yu", WireBytes().raw({"\1\0\1\0\0\0\0\0", 8}));
 }
 

@@ -47,6 +47,7 @@ char naturalCode(NumberKind kind) {
       return 'x';
     case NumberKind::kUInt64:
       return 't';
+    // D-Bus has no floating-point type of 32 bits.
     case NumberKind::kFloat:
     case NumberKind::kDouble:
       return 'd';
@@ -140,6 +141,7 @@ bool ValueEncoder::append(std::string_view type, const Value& value, unsigned le
 bool ValueEncoder::appendNumberAs(char code, const Value& value) {
   switch (code) {
     case 'b':
+      // D-Bus encodes a boolean in four bytes.
       appendNumber<std::uint32_t>(value.toBool() ? 1 : 0);
       return true;
     case 'y':

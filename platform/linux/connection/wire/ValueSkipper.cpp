@@ -31,6 +31,7 @@ bool skipArray(WireReader& reader, std::string_view element, unsigned level) {
   std::size_t outerLimit = 0;
   if (!reader.enterArray(alignmentOf(element.front()), outerLimit)) return false;
   while (!reader.atLimit()) {
+    // An entry is not a level of its own, in contrast to a struct.
     const bool sound = element.front() == '{'
                            ? skipMembers(reader, element.substr(1, element.size() - 2), level)
                            : skip(reader, element, level);

@@ -55,6 +55,7 @@ std::optional<Number> numberOf(std::string_view text, std::string_view key) {
 }  // namespace
 
 std::optional<PcmStatus> parsePcmStatus(std::string_view text) {
+  // A substream that is not open has this word instead of the fields.
   if (trimmed(text) == "closed") return PcmStatus{};
   const auto word = valueOf(text, "state");
   const auto hardware = numberOf<std::uint64_t>(text, "hw_ptr");

@@ -42,6 +42,7 @@ std::optional<NodeState> nodeState(pw_node_state state) {
       return NodeState::kIdle;
     case PW_NODE_STATE_SUSPENDED:
       return NodeState::kSuspended;
+    // Neither of these two is a state that reports have.
     case PW_NODE_STATE_CREATING:
     case PW_NODE_STATE_ERROR:
       break;
@@ -271,7 +272,7 @@ void GraphFollower::onGlobalRemoved(GlobalID id) {
 }
 
 void GraphFollower::onRefused(GlobalID id, const char* message) {
-  kLog.info("PipeWire refused a request: ", message, " (object ", id, "); it is ignored");
+  kLog.info("PipeWire refused a request: ", message, " (object ", id, "); continuing without it");
 }
 
 void GraphFollower::onAnswered() {

@@ -56,7 +56,7 @@ void PipeWireOnDemand::sampled() {
   // Does not wait: other sessions' samples would wait with it.
   load(std::chrono::milliseconds::zero());
   if (source_ == nullptr) return;
-  // Without a session that holds a reading, nobody needs the server followed yet.
+  // While no session holds a reading, the source need not follow the server.
   if (const std::shared_ptr<Lease> lease = lease_.lock()) lease->ofLoaded = source_->read();
 }
 

@@ -220,6 +220,8 @@ class BucketReader {
     if (isComplete_) return kIOReportNoUpperBound;
     const auto number = MetricNumber::parse(text);
     const auto whole = number.has_value() ? number->cutDown() : std::nullopt;
+    // The bounds of a report's buckets are integers. A fraction that is rounded would move hits to
+    // another bucket.
     if (!whole.has_value() || *whole < 0 || static_cast<double>(*whole) != number->value) {
       refuse(sample.line, "expected a whole number or +Inf as the bucket's bound");
     }

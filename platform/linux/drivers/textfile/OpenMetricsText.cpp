@@ -328,9 +328,11 @@ class Parser {
 std::optional<MetricNumber> MetricNumber::parse(std::string_view text) {
   if (const auto named = namedNumber(text)) return MetricNumber{*named, std::nullopt};
   std::string_view digits = text;
+  // OpenMetrics allows a plus sign, std::from_chars() does not.
   if (digits.starts_with('+')) digits.remove_prefix(1);
   const bool isSigned = digits.starts_with('-') && digits.size() == text.size();
   const std::size_t first = isSigned ? 1 : 0;
+  // std::from_chars() would also take names of infinities, which are handled above.
   if (digits.size() <= first || (!isDigit(digits[first]) && digits[first] != '.')) {
     return std::nullopt;
   }

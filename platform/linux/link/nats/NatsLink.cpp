@@ -148,7 +148,8 @@ bool NatsLink::close() {
   return true;
 }
 
-// False if the thread still works at leaveBy_, which the thread itself may bring forward.
+// False if the thread still works at leaveBy_. The thread itself moves that time: to a later one
+// before work that ends within known limits, and to an earlier one before work that may hang.
 bool NatsLink::awaitThread() {
   {
     const MutexLock lock(mutex_);
@@ -254,6 +255,7 @@ void NatsLink::run() {
       step = nextStep(std::chrono::steady_clock::now());
       if (step == Step::kWait) waitForChange();
     }
+    // Without the lock: most steps call the library, and some wait for a server.
     if (!perform(step)) return;
   }
 }

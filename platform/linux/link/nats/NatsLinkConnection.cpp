@@ -45,6 +45,7 @@ Array serversOf(natsConnection* connection) {
   std::vector<Value> values;
   for (char* const url : std::span(urls, static_cast<std::size_t>(count))) {
     values.emplace_back(std::string_view(url));
+    // The library allocates the list and its texts with malloc().
     std::free(url);
   }
   std::free(static_cast<void*>(urls));

@@ -99,6 +99,7 @@ void NatsPublisher::detach() {
   std::vector<PendingAcks::Entry> lost;
   {
     const MutexLock lock(mutex_);
+    // Window and flow describe a connection. The next one begins with neither.
     isWindowFull_ = false;
     flow_ = Flow::kFlowing;
     isStreamInDoubt_ = false;

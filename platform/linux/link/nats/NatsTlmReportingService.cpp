@@ -16,7 +16,7 @@ namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsTlmReportingService");
 constexpr const char* kMessageIdHeader = "Nats-Msg-Id";
-// Roughly what the header adds to a message. Servers include it in their limit of sizes.
+// Roughly what the header adds to a message. Servers count it as part of the message's size.
 constexpr std::size_t kHeaderBytes = 80;
 
 // One for each thread, because it reuses its buffer.

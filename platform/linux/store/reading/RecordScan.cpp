@@ -81,6 +81,7 @@ SqliteCode RecordScan::prepare(std::string_view order, Statement& statement) {
 
 SqliteCode RecordScan::skipToNewest(std::uint64_t count) {
   Statement statement;
+  // From the newest back, so that no more records are read than are wanted.
   SqliteCode code = prepare("DESC", statement);
   if (code != SQLITE_OK) return code;
   statement.bind(1, bounds_.first);

@@ -65,6 +65,7 @@ std::optional<StoreError> StoreReader::openDatabase() {
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   const std::string& path = files_->database().native();
+  // A service that has just started may have made the file and no table yet.
   if (*version == 0) {
     return StoreError{StoreError::Kind::kMissing, path + ": nothing has been stored yet"};
   }

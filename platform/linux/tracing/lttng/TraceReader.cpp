@@ -219,6 +219,7 @@ class TraceGraph {
       return false;
     }
     const bt_component_source* source = nullptr;
+    // Names must be unique within a graph.
     const std::string name = "source" + std::to_string(sources_++);
     if (bt_graph_add_source_component(graph_.get(), type, name.c_str(), parameters.get(),
                                       BT_LOGGING_LEVEL_NONE,
