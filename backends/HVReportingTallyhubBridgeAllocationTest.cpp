@@ -13,7 +13,7 @@
 namespace halvox {
 namespace {
 
-// Collects no event and does not allocate to say so.
+// Collects no event, and allocates nothing when it is asked.
 class UnusedAnalyticsService final : public platform::AnalyticsService {
  public:
   bool isAnalyticsEventUsed(std::string_view /*eventName*/) override {

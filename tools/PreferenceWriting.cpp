@@ -119,7 +119,7 @@ Result<void> changePreferenceFile(const std::filesystem::path& named, const Pref
   std::filesystem::create_directories(directory, error);
   if (error) return failure(directory, error.value());
   // The directory is locked and not the file. The change replaces the file, and a lock on the old
-  // one would keep nobody from changing the new one.
+  // one would not protect the new one.
   const UniqueFd held(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   if (!held) return failure(directory, errno);
   if (!lock(held.get(), patience)) {

@@ -43,8 +43,8 @@ class StreamSession {
   void setFormat(const StreamFormat& format);
   // Ignores an empty route: a stream that is being moved has no device for a moment.
   void setRoute(const Route& route);
-  // Volume controls of the stream have changed. Sends the volume if it, or whether the stream
-  // plays, differs from the last message.
+  // Volume controls of the stream have changed. Sends the volume if it or the playing
+  // state differs from the last message.
   void changeVolume(const VolumeChange& change);
   // The stream missed the cycle that began at `cycle` and lasted `lost`. A later reportXruns()
   // reports it.

@@ -1,5 +1,5 @@
 #!/usr/bin/env bash
-# Runs every fuzz target from its seeds, two at a time. The targets share that many seconds of CPU
+# Runs every fuzz target from its seeds, two at a time. The targets share SECONDS of CPU
 # time evenly.
 # fuzz.sh DIRECTORY-OF-TARGETS SECONDS
 set -euo pipefail

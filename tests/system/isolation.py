@@ -40,7 +40,7 @@ def program(name):
 
 
 def enter():
-    """Gives up being root and hides root's tracer, both for the rest of the process.
+    """Gives up the rights of root and hides root's tracer, both for the rest of the process.
 
     Skips the module if its traces could end up in the daemon of somebody else.
     """

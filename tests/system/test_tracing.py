@@ -346,7 +346,7 @@ class ToolTest(unittest.TestCase):
             self.assertIn("false ended with status 1", done.stderr)
 
     def assert_only_failures(self, output):
-        """With --json each failure is an object, and there is no result besides it."""
+        """With --json each failure is an object, and no result is printed."""
         objects = [json.loads(line) for line in output.splitlines()]
         self.assertGreater(len(objects), 0)
         self.assertEqual({(each["command"], each["result"]) for each in objects},
