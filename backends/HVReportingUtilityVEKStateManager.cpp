@@ -53,8 +53,7 @@ void HVReportingUtilityVEKStateManager::handleEvent(
   if (message->find(activeTime) == nullptr) return;
   counters().received.add();
   // Compared with the time stamps, unlike a session's history: a client that repeats a report gets
-  // new stamps, so only one message that is sent to several sessions repeats itself. This is
-  // required.
+  // new stamps. Only one message that is sent to several sessions repeats itself. This is required.
   if (*message == messageCache()) {
     counters().repeated.add();
     return;

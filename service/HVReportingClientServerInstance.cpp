@@ -28,10 +28,9 @@ const RequestCounters& counters() {
   return made;
 }
 
-// The name of the process that sent a message; none if the process has ended. A
-// process may rename itself at any time, so the name is looked up for each message instead of being
-// kept. A look-up reads a file, about as much work as the rest of a message, so it is made only for
-// the messages whose sender is used.
+// The name of the process that sent a message; none if the process has ended. The name is looked up
+// for each message, because a process may rename itself at any time. A look-up reads a file, which
+// costs about as much as the rest of a message. It is made only for messages whose sender is used.
 std::optional<std::string> senderProcessName(AudioEventType type, platform::ProcessID sender) {
   if (!HVReportingUtilityVEKStateManager::concerns(type)) return std::nullopt;
   if (!HVReportingUtilityIsInternalBuild()) return std::nullopt;

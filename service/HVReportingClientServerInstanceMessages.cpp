@@ -128,8 +128,8 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
 
 void HVReportingClientServerInstance::sendStandalone(const MessageRequest& request,
                                                      const Delegate& delegate) const {
-  // The back-ends need a session, so a message without one gets a temporary one. It is never
-  // started and enters no map; the queued payloads hold it until they are built.
+  // The back-ends need a session: a message without one gets a temporary one. It is never started
+  // and enters no map; the queued payloads hold it until they are built.
   const auto session = std::make_shared<HVReportingSession>(
       kStandaloneReporterID,
       HVReportingSession::ProcessIdentifiers{platform::process().ownProcessIdentifier()});

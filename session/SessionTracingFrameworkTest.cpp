@@ -202,7 +202,7 @@ TEST_F(SessionTracingFrameworkTest, StopOfTheFrameworkWhileTheRunnerRecordsWaits
   letRun();
   chooseFramework();
 
-  // The framework has no trace, so none completes and the wait never ends. This is required.
+  // The framework has no trace. None completes, and the wait never ends. This is required.
   EXPECT_THROW(session_->stop(), std::logic_error);
 
   EXPECT_TRUE(session_->started());

@@ -47,7 +47,7 @@ bool waitForRecords(int storeDescriptor, int outputDescriptor) {
   // The output is polled for errors only: while no records come, a pipe without a reader shows in
   // no other way.
   std::array<pollfd, 2> polled{{{storeDescriptor, POLLIN, 0}, {outputDescriptor, 0, 0}}};
-  // Only a signal can make it fail here, so it is called again.
+  // Only a signal can make it fail here.
   while (poll(polled.data(), polled.size(), -1) < 0) {
   }
   return (polled[1].revents & (POLLERR | POLLHUP | POLLNVAL)) == 0;

@@ -32,7 +32,7 @@ class Trace {
   // Passes the events to every measurement, in the order in which the measurements were added.
   void processTracepoints(const TraceData::Session& session, const TraceData::Events& events);
   // Adds the results of all measurements to the trace's own and returns these. A second call adds
-  // them again and returns every value twice; that is required, so call it once.
+  // them again and returns every value twice, which is required. Call it once.
   Results getResults();
 
  private:

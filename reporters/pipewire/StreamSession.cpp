@@ -137,8 +137,8 @@ void StreamSession::restate() {
   if (!started_) {
     return;
   }
-  // The service has lost its history with its sessions, so even a volume that has not changed is
-  // news to it.
+  // The service has lost its history with its sessions. It needs even a volume that has not
+  // changed.
   sentVolume_.reset();
   sendFormat();
   sendRoute();

@@ -42,7 +42,7 @@ def program(name):
 def enter():
     """Gives up the rights of root and hides root's tracer, both for the rest of the process.
 
-    Skips the module if its traces could end up in the daemon of somebody else.
+    Skips the module if its traces could end up in another user's daemon.
     """
     global _is_entered
     if _is_entered:

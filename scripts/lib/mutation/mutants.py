@@ -1,4 +1,4 @@
-"""Which small changes a source can be given."""
+"""The small changes that can be made to a source."""
 
 import re
 from dataclasses import dataclass
