@@ -28,7 +28,7 @@ class LogCategory {
 
   // True if someone wants lines of that level.
   [[nodiscard]] bool isEnabled(LogLevel level) const {
-    // Orders with nothing: a change of the level may be seen a little later.
+    // Relaxed, because a change of the level may be seen a little later.
     return level >= threshold_.load(std::memory_order_relaxed);
   }
 

@@ -46,7 +46,7 @@ enum class ProtoWireType : std::uint8_t {
 // beyond the bytes is ever read.
 class ProtoReader {
  public:
-  // The number is wider than a legal one, because it is what the bytes say.
+  // The number has 64 bits, although valid ones fit into 29: malformed bytes may hold any.
   struct Tag {
     std::uint64_t number;
     ProtoWireType wireType;

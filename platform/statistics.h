@@ -13,7 +13,7 @@ class Counter {
   [[nodiscard]] std::uint64_t value() const { return value_.load(std::memory_order_relaxed); }
 
  private:
-  std::atomic<std::uint64_t> value_{0};  // orders with nothing: it is only ever summed up
+  std::atomic<std::uint64_t> value_{0};  // relaxed: no other memory is published through it
 };
 
 // The service's own bookkeeping: what was received, delivered, suppressed and dropped, by reason.

@@ -18,7 +18,7 @@ namespace halvox::platform::detail {
 
 using ReferenceCount = std::atomic<std::uint32_t>;
 
-// Orders with nothing: the caller copies a reference that it has already.
+// Relaxed, because the caller copies a reference that it already holds.
 inline void retain(ReferenceCount& references) noexcept {
   references.fetch_add(1, std::memory_order_relaxed);
 }

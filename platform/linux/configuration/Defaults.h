@@ -11,8 +11,8 @@
 namespace halvox::platform::linux_::defaults {
 
 // [listener]
-// A local client authenticates within milliseconds. 30 seconds bear a machine that swaps, and still
-// free the descriptors of clients that connect and stay silent.
+// A local client authenticates within milliseconds. 30 seconds are enough on a machine that swaps,
+// and still free the descriptors of clients that connect and stay silent.
 inline constexpr std::chrono::seconds kHandshakeTimeout{30};
 // From the first byte of a message to its last. Longer than the handshake, because a message may
 // have 32 MiB.

@@ -48,7 +48,7 @@ void ServerConnection::onCoreInfo(void* data, const pw_core_info* info) {
 
 void ServerConnection::onCoreDone(void* data, std::uint32_t id, int sequence) {
   auto* self = static_cast<ServerConnection*>(data);
-  // Answers to earlier requests are not meant.
+  // Answers to earlier requests do not count.
   if (id == PW_ID_CORE && sequence == self->request_) self->listener_.onAnswered();
 }
 

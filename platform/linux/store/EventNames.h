@@ -50,7 +50,7 @@ class EventNames {
   // Each slot is set once. Storing with release and loading with acquire make the entry's content
   // visible to every thread that finds it.
   std::unique_ptr<std::atomic<EventName*>[]> slots_;
-  // Bounds the growth. Relaxed: it orders with nothing.
+  // Bounds the growth. Relaxed: no other memory is published through it.
   std::atomic<std::size_t> count_{0};
 };
 

@@ -42,7 +42,7 @@ std::optional<NodeState> nodeState(pw_node_state state) {
       return NodeState::kIdle;
     case PW_NODE_STATE_SUSPENDED:
       return NodeState::kSuspended;
-    // Neither of these two is a state that reports have.
+    // Reports have no state for either of these.
     case PW_NODE_STATE_CREATING:
     case PW_NODE_STATE_ERROR:
       break;

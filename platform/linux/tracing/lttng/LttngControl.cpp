@@ -24,8 +24,8 @@ using Channel = UniqueHandle<lttng_channel*, lttng_channel_destroy>;
 using Event = UniqueHandle<lttng_event*, lttng_event_destroy>;
 
 constexpr const char* kChannel = "halvox";
-// The buffers of one processor: 16 MiB hold 200,000 events a second for the second that the
-// consumer may be late.
+// The buffers of one processor. 16 MiB hold the events of one second at a rate of 200,000 a second:
+// the consumer may be that late.
 constexpr std::uint64_t kSubBufferBytes = 1U << 20U;
 constexpr std::uint64_t kMostSubBuffers = 16;
 constexpr std::uint64_t kFewestSubBuffers = 4;
