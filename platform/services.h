@@ -25,7 +25,7 @@ class ResultsFileService;
 class StatisticsService;
 class TLMReportingService;
 
-// The platform services: everything outside itself that the system can ask for.
+// The platform services: everything that the system asks of the platform that it runs on.
 //
 // The composition root (service/main.cpp, or the FakePlatform of a test) makes the services, owns
 // them, and destroys them after all other threads have ended. This struct only refers to them.

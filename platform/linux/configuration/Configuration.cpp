@@ -294,8 +294,8 @@ std::filesystem::path configurationPath() {
   const std::filesystem::path own =
       environmentPath("XDG_CONFIG_HOME").value_or(homeDirectory() / ".config") /
       "halvox/halvox.toml";
-  // Only a file that is missing is passed over. One that cannot be read is an error, and must not
-  // be replaced by the system's in silence.
+  // Only a missing file is passed over. One that cannot be read is an error, which using the
+  // system's file instead would hide.
   const bool isMissing = ::access(own.c_str(), F_OK) != 0 && (errno == ENOENT || errno == ENOTDIR);
   return isMissing ? "/etc/halvox/halvox.toml" : own;
 }

@@ -83,7 +83,7 @@ void PeerConnection::onDelivered(bool begun, bool progress) {
   }
   stream_.setReading(true);
   if (handshake_ != nullptr) return;
-  // A whole message restarts the time. A client that sends single bytes of one gains nothing.
+  // Only a whole message restarts the time, so a client gains nothing by sending single bytes.
   if (progress || !begun) deadline_.stop();
   if (begun) host().messages().start(deadline_);
 }

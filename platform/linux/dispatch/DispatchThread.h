@@ -32,7 +32,8 @@ class DispatchThread {
   DispatchThread& operator=(const DispatchThread&) = delete;
   ~DispatchThread();
 
-  // Marks the calling thread as working for `queue` (null: for none) while it lives. Nests.
+  // Marks the calling thread as working for `queue` (null: for none) while this object lives. May
+  // be nested.
   class Working {
    public:
     // The caller keeps `label`, which names the queue in the log.

@@ -23,7 +23,7 @@ struct Module {
 // error names the module, the path and the system's reason. A module of another version of the
 // service is refused, because the classes that both share may differ. The module stays loaded until
 // the process ends: its libraries have threads, and objects of the service refer to its code.
-// Blocks for the disk. Any thread may call.
+// Blocks on the disk. Any thread may call.
 [[nodiscard]] Result<void*> loadModule(const Module& module);
 // The same for the module at that path.
 [[nodiscard]] Result<void*> loadModule(const Module& module, const std::filesystem::path& path);

@@ -50,8 +50,8 @@ struct Range {
 }  // namespace
 
 // One kernel trace. Belongs to the code that sets it up until it is started, and then to the queue
-// that it was started with. Between the end and the deliveries the reading thread uses the
-// recording and the clock; nobody else does then.
+// that it was started with. Between the end and the deliveries, only the reading thread uses the
+// recording and the clock.
 class LttngKtraceSession final : public KtraceSession {
  public:
   enum class State : std::uint8_t { kMade, kStarted, kEnded, kDestroyed };
@@ -217,7 +217,7 @@ bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
     return true;
   };
   const auto take = [&](trace_point point) {
-    // The clock is known anyway; the port has it only for sessions that ask.
+    // The reader gives each point a wall time. The port promises 0 to sessions that did not ask.
     if (!session->hasWalltimes) point.walltime = 0;
     batch->add(point);
     return batch->size() < kBatchEvents || deliver();

@@ -12,7 +12,7 @@ namespace halvox::platform::linux_ {
 // then it is a file beside the directory, which must be in the same file system. A service that is
 // killed leaves it there, where the next start deletes it.
 //
-// Blocks for the disk. Needs 64 KiB of memory and what the compression needs. After a failure
+// Blocks on the disk. Needs 64 KiB of memory and what the compression needs. After a failure
 // nothing is left of the archive.
 Result<void> packDirectory(const std::filesystem::path& directory,
                            const std::filesystem::path& archive);

@@ -35,7 +35,7 @@ struct TraceListener {
 };
 
 // Reads all "halvox:kdebug" events of the traces below a directory, in the order of their times.
-// Blocks for the disk, and as long as the listener takes. A directory without traces has no events,
+// Blocks on the disk, and as long as the listener takes. A directory without traces has no events,
 // which is not a failure. Any thread may call; each reading has a graph of its own.
 [[nodiscard]] TraceReading readTraces(const std::filesystem::path& directory,
                                       const TraceListener& listener);
