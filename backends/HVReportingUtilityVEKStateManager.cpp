@@ -82,7 +82,7 @@ void HVReportingUtilityVEKStateManager::takeSnapshot(AudioEventCategory category
   reporter->requestSnapshot(
       signature, kSnapshotSeconds, std::nullopt, std::nullopt,
       [](const Dictionary& response) { kLog.info("Response from ailmentReporter : ", response); });
-  // Not before the request, and the second report is not kept; both are required.
+  // Reset only after the request. The second report is not remembered. Both are required.
   setLeakedHapticsSessionCounter(0);
   setMessageCache({});
 }

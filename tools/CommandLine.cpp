@@ -80,7 +80,7 @@ class HelpFormatter final : public CLI::Formatter {
   }
 };
 
-// Replaces the library's headings by ours; commands inherit them from the program.
+// Replaces the library's headings with ours. Commands inherit them from the program.
 void nameThings(CLI::App& app) {
   // Set before any command is added: commands copy these settings.
   app.set_help_flag("-h,--help", "Print this help");

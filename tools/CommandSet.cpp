@@ -47,7 +47,8 @@ void CommandSet::addCommonOptions(CLI::App& app, CommandReach reach) {
 std::string CommandSet::readInput() {
   if (source_ == CommandSource::kScriptLine) {
     // The standard input may be the script itself.
-    throw CLI::ValidationError("JSON", "\"-\" is for single commands; in a script, write it out");
+    throw CLI::ValidationError("JSON",
+                               "\"-\" cannot be used in a script; write the JSON into the line");
   }
   return {std::istreambuf_iterator<char>(input_), {}};
 }

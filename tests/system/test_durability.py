@@ -41,7 +41,7 @@ class Durability(unittest.TestCase):
 
         reader = threading.Thread(target=read_answers)
         reader.start()
-        wait_for("answers that the half second does not cover",
+        wait_for("answers that are older than half a second",
                  lambda: len(answered) > OWED and answered[OWED][0] < time.monotonic() - 0.5)
 
         killed = time.monotonic()
