@@ -17,14 +17,14 @@ inline constexpr std::chrono::seconds kHandshakeTimeout{30};
 // From the first byte of a message to its last. Longer than the handshake, because a message may
 // have 32 MiB.
 inline constexpr std::chrono::seconds kMessageTimeout{60};
-// Permission bits of the socket of a system service: the audio programs of every user report.
+// Permission bits of the socket of a system service: the audio programs of all users connect to it.
 inline constexpr std::uint32_t kSocketModeOfSystem = 0666;
 
 // [storage]
 // Days. A month covers "it broke after the last update" without growing for ever.
 inline constexpr std::uint32_t kRetentionDays = 30;
 // MiB of database and write-ahead log together: room for roughly a million records of 500 bytes,
-// and small beside the disk of a desktop machine.
+// and little on the disk of a desktop machine.
 inline constexpr std::uint32_t kStorageMegabytes = 512;
 
 // [analytics]

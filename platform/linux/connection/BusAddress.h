@@ -32,7 +32,7 @@ struct StarterBus {
   friend bool operator==(const StarterBus&, const StarterBus&) = default;
 };
 
-// The bus that started this process, as it says in the environment; none if no bus did. A systemd
+// The bus that started this process, as the environment names it; none if no bus did. A systemd
 // unit that starts the service on behalf of a bus may set the kind without the address.
 std::optional<StarterBus> starterBus();
 

@@ -7,7 +7,7 @@ namespace halvox::platform::linux_ {
 
 DispatchPool::DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService& statistics)
     : runner_(std::move(runner)), labels_(statistics) {
-  // The others are made when they are needed; these watch the timer from the start.
+  // These threads watch the timer from the start. Those of other qualities are made when needed.
   if (!utility_.provide()) {
     throw std::system_error(std::make_error_code(std::errc::resource_unavailable_try_again),
                             "cannot start the threads of the queues");

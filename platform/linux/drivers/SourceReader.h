@@ -83,7 +83,8 @@ class SourceReader {
   Condition made_;
   bool isEnding_ HALVOX_GUARDED_BY(mutex_) = false;
   bool isLate_ HALVOX_GUARDED_BY(mutex_) = false;  // logged, and not in time again yet
-  // Readings are numbered from 1: the latest one that was asked for, that began, that is finished.
+  // Numbers of readings, from 1: of the latest that was asked for, that has begun, and that is
+  // finished.
   std::uint64_t lastWanted_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t lastBegun_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t lastMade_ HALVOX_GUARDED_BY(mutex_) = 0;

@@ -38,8 +38,8 @@ Result<void*> loadModule(const Module& module, const std::filesystem::path& path
   const auto failure = [&](const std::string& why) {
     return Failure<>{std::string(module.file) + ": " + why};
   };
-  // Now: a symbol that the program does not have is an error here, and not the end of the process
-  // at the first call.
+  // RTLD_NOW: a symbol that the program does not have is an error here, and not the end of the
+  // process at the first call.
   void* const library = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
   if (library == nullptr) return failure(lastError());
   // Before the entry point: a module of another release may have one of the same name.

@@ -65,7 +65,7 @@ Result<void> addChannel(lttng_handle* handle) {
   if (!channel) return Failure<>{"cannot create a channel"};
   copyName(channel.get()->name, kChannel);
   // When the buffers are full, new events are lost and counted. Overwriting old ones would lose the
-  // begins of intervals without a count.
+  // beginnings of intervals, and nothing would count them.
   channel.get()->attr.overwrite = 0;
   channel.get()->attr.subbuf_size = kSubBufferBytes;
   channel.get()->attr.num_subbuf = subBuffers();
