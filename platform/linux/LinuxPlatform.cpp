@@ -130,7 +130,9 @@ bool LinuxPlatform::close() {
   const bool linkEnded = !adapters_->nats || adapters_->nats->close();
   // After the link: the local one writes to the store until its last message.
   adapters_->store.close();
+  // After everything that counts has ended: sums agree only then.
   logStatistics(adapters_->statistics, LogLevel::kInfo, Counters::kCounted);
+  // Last, because everything above may log.
   adapters_->log->stop();
   return ended && linkEnded;
 }

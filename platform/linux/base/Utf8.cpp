@@ -82,6 +82,8 @@ bool isValid(std::string_view text) {
 
 bool isPlain(char character) { return character >= 0x20 && character < 0x7F; }
 
+// Includes the control characters above ASCII, and the line and paragraph separators (U+2028 and
+// U+2029), at which some programs break lines.
 bool isUnprintable(char32_t character) {
   return character < 0x20 || (character >= 0x7F && character < 0xA0) || character == 0x2028 ||
          character == 0x2029;

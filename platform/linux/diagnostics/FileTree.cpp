@@ -12,6 +12,8 @@ namespace fs = std::filesystem;
 // is arbitrary, would decide which files are beyond the bounds.
 std::vector<fs::path> filesBelow(const fs::path& root, const TreeBounds& bounds,
                                  const Deadline& deadline, Tree& tree) {
+  // Directories and other entries count too: a tree that has hardly any files must not be walked to
+  // its end.
   constexpr std::size_t kLooksPerFile = 16;
   std::vector<fs::path> paths;
   std::size_t looks = 0;

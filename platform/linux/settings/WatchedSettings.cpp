@@ -117,6 +117,7 @@ std::set<std::string> WatchedSettings::settle() {
 bool WatchedSettings::settleName(const std::string& name) {
   const NotifyFile before = std::exchange(names_.known[name], NotifyFile{mark(name)});
   const auto& now = names_.known[name].mark;
+  // A file that has only disappeared is not a post.
   const bool isNews = before.wasTouched || (now.has_value() && now != before.mark);
   if (!isNews) counters_.unchanged.add();
   return isNews;

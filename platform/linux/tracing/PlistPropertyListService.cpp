@@ -160,6 +160,7 @@ std::optional<Data> PlistPropertyListService::readFile(std::string_view path,
     case FileContent::Outcome::kNotRegular:
       return fail(S_ISDIR(content.mode) ? EISDIR : EINVAL);
     case FileContent::Outcome::kTooLarge:
+      // A file that was small enough when it was opened has grown since: it is being written.
       return fail(content.size > kMostFileBytes ? EFBIG : EAGAIN);
     case FileContent::Outcome::kMissing:
     case FileContent::Outcome::kFailed:

@@ -42,6 +42,7 @@ std::optional<StoreError> EventFollower::open(const std::filesystem::path& direc
   directory_ = directory;
   filter_ = filter;
   started_ = false;
+  // Callers wait on one descriptor, which stands for both sources.
   poller_.reset(::epoll_create1(EPOLL_CLOEXEC));
   timer_.reset(::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC));
   watch_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
@@ -90,6 +91,7 @@ std::optional<StoreError> EventFollower::deliverBy(Read read) {
   // Not after the last record that was delivered: when the filter lets none through, as `newest` 0
   // does, everything that is stored would count as new the next time.
   if (!error.has_value()) filter_.after = std::max(filter_.after, reader_.lastRead());
+  // Limits the first delivery only: all that comes later is new.
   filter_.newest.reset();
   return error;
 }
@@ -118,6 +120,7 @@ EventFollower::Change EventFollower::readChanges() {
       if ((event->mask & (IN_DELETE_SELF | IN_MOVE_SELF | IN_IGNORED)) != 0) {
         return Change::kDirectoryGone;
       }
+      // The kernel has dropped events, and some of them may have been of the store.
       const bool overflow = (event->mask & IN_Q_OVERFLOW) != 0;
       if (overflow || (event->len > 0 && isStoreFile(event->name))) change = Change::kStoreWritten;
     }

@@ -35,6 +35,7 @@ SqliteCode findBounds(Database& database, const std::string& recordsTable,
       readBound(database, "SELECT ifnull(max(id), 0) FROM " + recordsTable, 0, bounds.last);
   if (code == SQLITE_OK && filter.since.has_value()) {
     std::int64_t span = 0;
+    // Begins with the newest span if none is recent enough. With 0, all records would be read.
     code = readBound(database,
                      "SELECT ifnull(min(span), (SELECT max(span) FROM " + spansTable + ")) FROM " +
                          spansTable + " WHERE last_time >= ?1",

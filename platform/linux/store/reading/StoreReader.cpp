@@ -54,6 +54,7 @@ std::optional<StoreError> StoreReader::open(const std::filesystem::path& directo
   if (error.has_value()) {
     database_.close();
   } else {
+    // From before the opening: if another file took the name in between, isReplaced() notices.
     identity_ = FileIdentity{status.st_dev, status.st_ino};
   }
   return error;
@@ -89,6 +90,7 @@ SqliteCode StoreReader::openFile() {
   // Reading a WAL database takes its -shm file, which a user who may only read cannot create. Such
   // a user can still read a database that was closed in good order: without a log, the file alone
   // is complete.
+  // The low byte is the code itself; the other bits say more about it.
   const bool needsLog = (code & 0xFF) == SQLITE_CANTOPEN || (code & 0xFF) == SQLITE_READONLY;
   return needsLog && files_->logBytes() == 0 ? attempt(immutableURI(path)) : code;
 }
@@ -118,6 +120,7 @@ std::optional<StoreError> StoreReader::forEachRecord(const RecordTable& table,
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   lastRead_ = 0;
+  // A store that an older service wrote lacks the table, and has no such records.
   if (*version < table.sinceVersion) return std::nullopt;
   RecordScan scan(database_, table, filter);
   SqliteCode code = scan.begin();
