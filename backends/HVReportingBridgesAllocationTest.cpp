@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include "backends/BackEndCounters.h"
 #include "backends/HVReportingJoulebookUtility.h"
 #include "backends/HVReportingUtilityVEKStateManager.h"
 #include "backends/HVReportingZUBBridge.h"
@@ -16,8 +17,11 @@ namespace {
 TEST(HVReportingBridgesAllocationTest, MessagesThatConcernNoBridgeAllocateNothing) {
   platform::FakePlatform fakes;
   const auto session = std::make_shared<HVReportingSession>(
-      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
-  HVReportingUtilityVEKStateManager manager;
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12},
+      SessionCounters::make(fakes.statistics));
+  HVReportingUtilityVEKStateManager manager(fakes.statistics);
+  const PowerLogCounters powerLog(fakes.statistics);
+  const IssueMetricCounters issueMetrics(fakes.statistics);
   // Has the keys of all bridges, so that only the type makes them ignore it.
   const platform::Message message = platform::Dictionary{
       {"EngineOnTime", 1}, {"Haptic_Active_Hardware_Time_Seconds", 2}, {"issue_type", "a"}};
@@ -27,8 +31,8 @@ TEST(HVReportingBridgesAllocationTest, MessagesThatConcernNoBridgeAllocateNothin
   ASSERT_GT(before, 0U);  // the counter works
   for (const auto type : {AudioEventType::kStart, AudioEventType::kError,
                           AudioEventType::kAudioUnitUsage, AudioEventType::kUnknown}) {
-    HVReportingJoulebookUtility::handleEvent(message, kCategory, type, session);
-    HVReportingZUBBridge::handleEvent(message, kCategory, type, session);
+    HVReportingJoulebookUtility::handleEvent(message, kCategory, type, session, powerLog);
+    HVReportingZUBBridge::handleEvent(message, kCategory, type, session, issueMetrics);
     manager.handleEvent(message, kCategory, type, session, "player");
   }
 

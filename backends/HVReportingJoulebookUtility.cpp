@@ -3,11 +3,11 @@
 #include <cstdint>
 #include <string_view>
 
+#include "backends/BackEndCounters.h"
 #include "backends/HVReportingUtility.h"
 #include "platform/log.h"
 #include "platform/power_log.h"
 #include "platform/services.h"
-#include "platform/statistics.h"
 #include "session/HVReportingSession.h"
 
 namespace halvox {
@@ -24,22 +24,6 @@ constexpr platform::UnitLog kLog(&HVReportingJoulebookCategory, "HVReportingJoul
 constexpr std::uint32_t kPowerLogCategory = 28;
 constexpr std::string_view kEngineEvent = "Oxbow_Haptics";
 constexpr std::string_view kLeakEvent = "LeakedHapticsSessionInfo";
-
-// received = delivered + dropped.
-struct PowerCounters {
-  platform::Counter& received;
-  platform::Counter& delivered;
-  platform::Counter& unknown;
-};
-
-const PowerCounters& counters() {
-  constexpr std::string_view kPiece = "power log bridge";
-  platform::StatisticsService& statistics = platform::statistics();
-  static const PowerCounters made{statistics.counter(kPiece, "received"),
-                                  statistics.counter(kPiece, "delivered"),
-                                  statistics.counter(kPiece, "dropped: no known report")};
-  return made;
-}
 
 Dictionary enginePayload(const Dictionary& message, const Value& onTime,
                          const HVReportingSession& session) {
@@ -75,25 +59,27 @@ Dictionary leakPayload(const Dictionary& message, const Key& key, const Value& a
 
 void logEvent(std::string_view name, const Dictionary& payload) {
   platform::powerLog().logPowerEvent(kPowerLogCategory, name, payload, std::nullopt);
-  counters().delivered.add();
 }
 
 }  // namespace
 
 void HVReportingJoulebookUtility::handleEvent(const platform::Message& message,
                                               AudioEventCategory /*category*/, AudioEventType type,
-                                              const std::shared_ptr<HVReportingSession>& session) {
+                                              const std::shared_ptr<HVReportingSession>& session,
+                                              const PowerLogCounters& counters) {
   if (type != AudioEventType::kJoulebook || !message.has_value()) return;
   static const Key engineOnTime("EngineOnTime");
   static const Key activeTime("Haptic_Active_Hardware_Time_Seconds");
-  counters().received.add();
+  counters.received.add();
   // A message with both keys is an engine report only; this is required.
   if (const Value* onTime = message->find(engineOnTime)) {
     logEvent(kEngineEvent, enginePayload(*message, *onTime, *session));
+    counters.delivered.add();
   } else if (const Value* leaked = message->find(activeTime)) {
     logEvent(kLeakEvent, leakPayload(*message, activeTime, *leaked));
+    counters.delivered.add();
   } else {
-    counters().unknown.add();
+    counters.unknown.add();
   }
 }
 

@@ -8,6 +8,7 @@
 namespace halvox {
 
 class HVReportingSession;
+struct PowerLogCounters;
 
 // Forwards reports about energy use to the power log: how long a haptics engine was on, and haptics
 // sessions that were left running ("leaked"). Keeps no state; any thread may call. Returns no
@@ -20,7 +21,8 @@ class HVReportingJoulebookUtility {
   // engine takes precedence. Ignores messages of other types and a missing message. Does not use
   // the category. Values reach the power log unchanged. `session` must not be null.
   static void handleEvent(const platform::Message& message, AudioEventCategory category,
-                          AudioEventType type, const std::shared_ptr<HVReportingSession>& session);
+                          AudioEventType type, const std::shared_ptr<HVReportingSession>& session,
+                          const PowerLogCounters& counters);
 };
 
 }  // namespace halvox

@@ -5,6 +5,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include "backends/BackEndCounters.h"
 #include "platform/fake/FakePlatform.h"
 #include "session/HVReportingSession.h"
 
@@ -27,12 +28,14 @@ class HVReportingJoulebookUtilityTest : public testing::Test {
   }
 
   void handle(const Message& message, AudioEventType type = AudioEventType::kJoulebook) {
-    HVReportingJoulebookUtility::handleEvent(message, AudioEventCategory::kOutput, type, session_);
+    HVReportingJoulebookUtility::handleEvent(message, AudioEventCategory::kOutput, type, session_,
+                                             PowerLogCounters(platform_.statistics));
   }
 
   platform::FakePlatform platform_;
   std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
-      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12},
+      SessionCounters::make(platform_.statistics));
 };
 
 TEST_F(HVReportingJoulebookUtilityTest, AnEngineReportIsLoggedWithItsApplicationAndEnd) {
@@ -70,7 +73,8 @@ TEST_F(HVReportingJoulebookUtilityTest, AnEngineReportWithoutATimeIsLoggedAsAnEr
 
 TEST_F(HVReportingJoulebookUtilityTest, AnApplicationWithoutANameIsUnknown) {
   session_ = std::make_shared<HVReportingSession>(ReporterID{8},
-                                                  HVReportingSession::ProcessIdentifiers{12});
+                                                  HVReportingSession::ProcessIdentifiers{12},
+                                                  SessionCounters::make(platform_.statistics));
   platform_.log.clear();
 
   handle(Dictionary{{"EngineOnTime", 1}, {"hvreporting_timestamp", 2}});

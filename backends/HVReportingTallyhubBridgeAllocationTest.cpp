@@ -33,7 +33,8 @@ TEST(HVReportingTallyhubBridgeAllocationTest, AMessageThatNobodyCollectsAllocate
   UnusedAnalyticsService analytics;
   platform::installServices(fakes.servicesWith(analytics));
   const auto session = std::make_shared<HVReportingSession>(
-      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12},
+      SessionCounters::make(fakes.statistics));
   const platform::Message message = platform::Dictionary{{"a", 1}};
 
   const std::size_t before = platform::allocationsOfThisThread();

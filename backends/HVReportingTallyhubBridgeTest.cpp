@@ -40,7 +40,8 @@ class HVReportingTallyhubBridgeTest : public testing::Test {
 
   platform::FakePlatform platform_;
   std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
-      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12},
+      SessionCounters::make(platform_.statistics));
 };
 
 // --- Names --------------------------------------------------------------------------------------

@@ -6,7 +6,6 @@
 #include "platform/diagnostic_reporter.h"
 #include "platform/log.h"
 #include "platform/services.h"
-#include "platform/statistics.h"
 #include "session/HVReportingSession.h"
 
 namespace halvox {
@@ -24,25 +23,11 @@ constexpr std::uint64_t kReportsBeforeSnapshot = 1;
 // The snapshot captures the present state, not a period to come.
 constexpr double kSnapshotSeconds = 0;
 
-// received = delivered (to the bug-capture service) + suppressed.
-struct LeakCounters {
-  platform::Counter& received;
-  platform::Counter& delivered;
-  platform::Counter& counted;
-  platform::Counter& repeated;
-};
-
-const LeakCounters& counters() {
-  constexpr std::string_view kPiece = "bug capture bridge";
-  platform::StatisticsService& statistics = platform::statistics();
-  static const LeakCounters made{statistics.counter(kPiece, "received"),
-                                 statistics.counter(kPiece, "delivered"),
-                                 statistics.counter(kPiece, "suppressed: first of two"),
-                                 statistics.counter(kPiece, "suppressed: repeated")};
-  return made;
-}
-
 }  // namespace
+
+HVReportingUtilityVEKStateManager::HVReportingUtilityVEKStateManager(
+    platform::StatisticsService& statistics)
+    : counters_(statistics) {}
 
 void HVReportingUtilityVEKStateManager::handleEvent(
     const platform::Message& message, AudioEventCategory category, AudioEventType type,
@@ -51,22 +36,22 @@ void HVReportingUtilityVEKStateManager::handleEvent(
   if (!concerns(type) || !message.has_value()) return;
   static const Key activeTime("Haptic_Active_Hardware_Time_Seconds");
   if (message->find(activeTime) == nullptr) return;
-  counters().received.add();
+  counters_.received.add();
   // Compared with the time stamps, unlike a session's history: a client that repeats a report gets
   // new stamps. Only one message that is sent to several sessions repeats itself. This is required.
   if (*message == messageCache()) {
-    counters().repeated.add();
+    counters_.repeated.add();
     return;
   }
   if (leakedHapticsSessionCounter() == kReportsBeforeSnapshot) {
     takeSnapshot(category, *session, processName);
-    counters().delivered.add();
+    counters_.delivered.add();
     return;
   }
   setMessageCache(*message);
   kLog.info("Incrementing VEK counter. ", processName.value_or("(null)"));
   setLeakedHapticsSessionCounter(leakedHapticsSessionCounter() + 1);
-  counters().counted.add();
+  counters_.counted.add();
 }
 
 void HVReportingUtilityVEKStateManager::takeSnapshot(AudioEventCategory category,

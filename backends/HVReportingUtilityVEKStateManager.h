@@ -7,6 +7,7 @@
 #include <optional>
 #include <string_view>
 
+#include "backends/BackEndCounters.h"
 #include "backends/HVReportingVocabulary.h"
 #include "platform/value.h"
 
@@ -32,7 +33,8 @@ class HVReportingUtilityVEKStateManager {
  public:
   using Reporter = std::shared_ptr<platform::AILDiagnosticReporter>;
 
-  HVReportingUtilityVEKStateManager() = default;
+  // Counts in `statistics`, which must outlive it.
+  explicit HVReportingUtilityVEKStateManager(platform::StatisticsService& statistics);
   HVReportingUtilityVEKStateManager(const HVReportingUtilityVEKStateManager&) = delete;
   HVReportingUtilityVEKStateManager& operator=(const HVReportingUtilityVEKStateManager&) = delete;
 
@@ -62,6 +64,7 @@ class HVReportingUtilityVEKStateManager {
   void takeSnapshot(AudioEventCategory category, const HVReportingSession& session,
                     std::optional<std::string_view> processName);
 
+  const BugCaptureCounters counters_;
   std::atomic<std::uint64_t> leakedHapticsSessionCounter_{0};  // orders nothing else
   mutable std::mutex mutex_;  // held only to copy or exchange the members below
   Reporter ailmentReporter_;

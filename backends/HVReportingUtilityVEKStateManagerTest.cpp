@@ -47,8 +47,9 @@ class HVReportingUtilityVEKStateManagerTest : public testing::Test {
 
   platform::FakePlatform platform_;
   std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
-      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
-  HVReportingUtilityVEKStateManager manager_;
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12},
+      SessionCounters::make(platform_.statistics));
+  HVReportingUtilityVEKStateManager manager_{platform_.statistics};
 };
 
 TEST_F(HVReportingUtilityVEKStateManagerTest, BeginsWithNothing) {
@@ -161,7 +162,7 @@ TEST_F(HVReportingUtilityVEKStateManagerTest, TheReplyIsOnlyLogged) {
 
 TEST_F(HVReportingUtilityVEKStateManagerTest, TheReplyMayComeAfterTheManagerIsDestroyed) {
   {
-    HVReportingUtilityVEKStateManager brief;
+    HVReportingUtilityVEKStateManager brief(platform_.statistics);
     brief.handleEvent(reportA(), kSession, AudioEventType::kJoulebook, session_, "player");
     brief.handleEvent(reportB(), kSession, AudioEventType::kJoulebook, session_, "player");
   }

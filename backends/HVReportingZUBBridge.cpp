@@ -8,10 +8,10 @@
 #include <system_error>
 
 #include "backends/AudioIssueDetected.h"
+#include "backends/BackEndCounters.h"
 #include "platform/log.h"
 #include "platform/metrics.h"
 #include "platform/services.h"
-#include "platform/statistics.h"
 
 namespace halvox {
 
@@ -71,29 +71,17 @@ zubmetrics::AudioIssueDetected makeMetric(const Dictionary& message) {
   return metric;
 }
 
-// received = delivered.
-struct IssueCounters {
-  platform::Counter& received;
-  platform::Counter& delivered;
-};
-
-const IssueCounters& counters() {
-  platform::StatisticsService& statistics = platform::statistics();
-  static const IssueCounters made{statistics.counter("issue metrics bridge", "received"),
-                                  statistics.counter("issue metrics bridge", "delivered")};
-  return made;
-}
-
 }  // namespace
 
 void HVReportingZUBBridge::handleEvent(const platform::Message& message,
                                        AudioEventCategory /*category*/, AudioEventType type,
-                                       const std::shared_ptr<HVReportingSession>& /*session*/) {
+                                       const std::shared_ptr<HVReportingSession>& /*session*/,
+                                       const IssueMetricCounters& counters) {
   if (type != AudioEventType::kIssueDetector || !message.has_value()) return;
-  counters().received.add();
+  counters.received.add();
   // Posted even if all keys are missing: that a client saw an issue counts.
   platform::metrics().postIssueMetric(kAudioIssueDetectedMetricID, makeMetric(*message));
-  counters().delivered.add();
+  counters.delivered.add();
 }
 
 }  // namespace halvox

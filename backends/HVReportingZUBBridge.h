@@ -9,6 +9,7 @@
 namespace halvox {
 
 class HVReportingSession;
+struct IssueMetricCounters;
 
 // Posts each audio issue that a client detected to the diagnostics metrics. Keeps no state; any
 // thread may call. Returns no error: a missing key is logged, and its field stays empty.
@@ -24,7 +25,8 @@ class HVReportingZUBBridge {
   // The duration is the low 32 bits of a number's integer, or of the integer at the beginning of a
   // text. The metric has no timestamp.
   static void handleEvent(const platform::Message& message, AudioEventCategory category,
-                          AudioEventType type, const std::shared_ptr<HVReportingSession>& session);
+                          AudioEventType type, const std::shared_ptr<HVReportingSession>& session,
+                          const IssueMetricCounters& counters);
 };
 
 }  // namespace halvox

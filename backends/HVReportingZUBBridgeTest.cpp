@@ -7,6 +7,7 @@
 #include <gtest/gtest.h>
 
 #include "backends/AudioIssueDetected.h"
+#include "backends/BackEndCounters.h"
 #include "platform/fake/FakePlatform.h"
 
 namespace halvox {
@@ -23,7 +24,8 @@ using zubmetrics::AudioIssueDetected;
 class HVReportingZUBBridgeTest : public testing::Test {
  protected:
   void handle(const Message& message, AudioEventType type = AudioEventType::kIssueDetector) {
-    HVReportingZUBBridge::handleEvent(message, AudioEventCategory::kPlayback, type, nullptr);
+    HVReportingZUBBridge::handleEvent(message, AudioEventCategory::kPlayback, type, nullptr,
+                                      IssueMetricCounters(platform_.statistics));
   }
   // Returns the newest metric as text.
   AudioIssueDetected posted() {

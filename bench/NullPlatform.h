@@ -175,7 +175,7 @@ class MapStatistics final : public platform::StatisticsService {
 };
 
 // Owns all services and installs them. Must live as long as the process: the code under test keeps
-// references to log categories and counters.
+// references to log categories in static variables.
 struct NullPlatform {
   explicit NullPlatform(platform::LogLevel level) : log(level) {
     platform::installServices(platform::servicesOf(*this, analytics));

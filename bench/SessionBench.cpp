@@ -130,7 +130,8 @@ void BM_SendMessage(benchmark::State& state, std::int64_t clients, std::int64_t 
 void BM_SessionSendMessage(benchmark::State& state, bool redundant) {
   nullPlatform();
   const auto session =
-      std::make_shared<HVReportingSession>(ReporterID{1}, HVReportingSession::ProcessIdentifiers{});
+      std::make_shared<HVReportingSession>(ReporterID{1}, HVReportingSession::ProcessIdentifiers{},
+                                           SessionCounters::make(nullPlatform().statistics));
   session->start();
   std::int64_t number = 0;
   while (state.KeepRunningBatch(kBatch)) {

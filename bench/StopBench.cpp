@@ -61,7 +61,8 @@ void forgetPeak() { std::ofstream("/proc/self/clear_refs") << "5"; }
 template <typename Make>
 std::shared_ptr<HVReportingSession> startedSession(Make make) {
   const auto session =
-      std::make_shared<HVReportingSession>(ReporterID{1}, HVReportingSession::ProcessIdentifiers{});
+      std::make_shared<HVReportingSession>(ReporterID{1}, HVReportingSession::ProcessIdentifiers{},
+                                           SessionCounters::make(nullPlatform().statistics));
   session->start();
   for (std::int64_t number = 0; number < kMessages; ++number) {
     session->sendMessage(make(number), AudioEventCategory::kPlayback, AudioEventType::kState,

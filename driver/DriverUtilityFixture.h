@@ -75,7 +75,8 @@ class DriverUtilityFixture : public testing::Test {
 
   platform::FakePlatform platform_;
   std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
-      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12},
+      SessionCounters::make(platform_.statistics));
 };
 
 }  // namespace driver_testing

@@ -210,7 +210,8 @@ TEST_F(HVReportingDriverUtilityTest, SessionsAtOnceEachHaveTheirOwnSnapshot) {
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
   const auto utility = makeUtility();
   const auto other = std::make_shared<HVReportingSession>(
-      ReporterID{8}, HVReportingSession::ProcessIdentifiers{12});
+      ReporterID{8}, HVReportingSession::ProcessIdentifiers{12},
+      SessionCounters::make(platform_.statistics));
   other->start();
   session_->setDriverSnapShot(utility.getSnapShot());
   platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 3)});

@@ -26,8 +26,8 @@ class StatisticsService {
   virtual ~StatisticsService() = default;
 
   // The counter of that piece and name, such as ("session", "suppressed: redundant"). The first
-  // call makes it. It lives as long as the process, and callers keep the reference: looking a
-  // counter up costs more than adding to it.
+  // call makes it, and it lives as long as the service. Callers look it up once and keep the
+  // reference, never in a static variable: a look-up takes a lock and compares names.
   virtual Counter& counter(std::string_view piece, std::string_view name) = 0;
 };
 

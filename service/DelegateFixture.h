@@ -57,7 +57,8 @@ class DelegateFixture : public testing::Test {
   platform::FakePlatform platform_;
   std::shared_ptr<Delegate> delegate_ = std::make_shared<Delegate>();
   std::shared_ptr<HVReportingClientServerInstance> client_ =
-      std::make_shared<HVReportingClientServerInstance>(100, delegate_);
+      std::make_shared<HVReportingClientServerInstance>(
+          100, delegate_, ServiceCounters::make(platform_.statistics));
 };
 
 }  // namespace halvox

@@ -5,7 +5,6 @@
 #include "backends/HVReportingUtility.h"
 #include "backends/HVReportingUtilityVEKStateManager.h"
 #include "platform/services.h"
-#include "platform/statistics.h"
 #include "service/ReportingQueue.h"
 #include "service/ServiceLog.h"
 
@@ -13,20 +12,6 @@ namespace halvox {
 namespace {
 
 constexpr int kKilledExitStatus = 2;
-
-// received = carried out, once the queue is empty.
-struct RequestCounters {
-  platform::Counter& received;
-  platform::Counter& carriedOut;
-};
-
-const RequestCounters& counters() {
-  constexpr std::string_view kPiece = "requests";
-  platform::StatisticsService& statistics = platform::statistics();
-  static const RequestCounters made{statistics.counter(kPiece, "received"),
-                                    statistics.counter(kPiece, "carried out")};
-  return made;
-}
 
 // The name of the process that sent a message; none if the process has ended. The name is looked up
 // for each message, because a process may rename itself at any time. A look-up reads a file, which
@@ -40,8 +25,9 @@ std::optional<std::string> senderProcessName(AudioEventType type, platform::Proc
 }  // namespace
 
 HVReportingClientServerInstance::HVReportingClientServerInstance(
-    platform::ProcessID pid, std::weak_ptr<HVReportingServiceDelegateProtocol> delegate)
-    : processIdentifier_(pid), delegate_(std::move(delegate)) {
+    platform::ProcessID pid, std::weak_ptr<HVReportingServiceDelegateProtocol> delegate,
+    Counters counters)
+    : processIdentifier_(pid), delegate_(std::move(delegate)), counters_(std::move(counters)) {
   kServiceLog.notice("new client with pid ", pid);
 }
 
@@ -82,11 +68,11 @@ HVReportingClientServerInstance::Session HVReportingClientServerInstance::findRe
 template <typename Work>
 void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
                                                    RequestContext&& context, Work work) {
-  counters().received.add();
+  counters_->requests.received.add();
   reportingQueue()->async(weight, [client = shared_from_this(), token = std::move(context.token),
                                    work = std::move(work)]() mutable {
     work(*client);
-    counters().carriedOut.add();
+    client->counters_->requests.carriedOut.add();
   });
 }
 

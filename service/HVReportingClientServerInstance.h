@@ -11,6 +11,7 @@
 #include "platform/value.h"
 #include "service/HVReportingServiceDelegateProtocol.h"
 #include "service/HVReportingServiceProtocol.h"
+#include "service/ServiceCounters.h"
 #include "session/Guarded.h"
 #include "session/HVReportingSession.h"
 #include "session/ResourceAccount.h"
@@ -30,13 +31,15 @@ class HVReportingClientServerInstance final
       public std::enable_shared_from_this<HVReportingClientServerInstance> {
  public:
   using Session = std::shared_ptr<HVReportingSession>;
+  using Counters = std::shared_ptr<const ServiceCounters>;
   using SessionMap = std::unordered_map<ReporterID, Session>;
   enum class Lookup : std::uint8_t { kOwnSessions, kAcrossAllClients };
 
   // Keeps `delegate` weakly. Without a delegate there are no other clients and reporting is
-  // disabled.
+  // disabled. `counters` are shared by all clients.
   HVReportingClientServerInstance(platform::ProcessID pid,
-                                  std::weak_ptr<HVReportingServiceDelegateProtocol> delegate);
+                                  std::weak_ptr<HVReportingServiceDelegateProtocol> delegate,
+                                  Counters counters);
   HVReportingClientServerInstance(const HVReportingClientServerInstance&) = delete;
   HVReportingClientServerInstance& operator=(const HVReportingClientServerInstance&) = delete;
   ~HVReportingClientServerInstance() override;
@@ -125,8 +128,8 @@ class HVReportingClientServerInstance final
   void sendToActiveSessions(const MessageRequest& request, const Delegate& delegate) const;
   void sendStandalone(const MessageRequest& request, const Delegate& delegate) const;
   // Offers the message to each back-end once for this session.
-  static void handToBackEnds(const MessageRequest& request, const Session& session,
-                             const Delegate& delegate);
+  void handToBackEnds(const MessageRequest& request, const Session& session,
+                      const Delegate& delegate) const;
 
   // All changes of the map and of its sessions' states go through these: they keep the delegate's
   // index and the client's account up to date.
@@ -136,6 +139,7 @@ class HVReportingClientServerInstance final
 
   const platform::ProcessID processIdentifier_;
   const std::weak_ptr<HVReportingServiceDelegateProtocol> delegate_;
+  const Counters counters_;
   const std::shared_ptr<ResourceAccount> account_ = std::make_shared<ResourceAccount>();
   Guarded<std::optional<platform::Date>> clientStartDate_;
   Guarded<std::optional<std::string>> clientProcessName_;

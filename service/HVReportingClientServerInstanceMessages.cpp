@@ -3,7 +3,6 @@
 #include "backends/HVReportingZUBBridge.h"
 #include "platform/clock.h"
 #include "platform/services.h"
-#include "platform/statistics.h"
 #include "service/HVReportingClientServerInstance.h"
 #include "service/RoundedSeconds.h"
 #include "service/ServiceLog.h"
@@ -18,24 +17,6 @@ constexpr std::string_view kErrorDomain = "com.tarno.audio.reporting";
 constexpr std::int64_t kReportingDisabled = 1;
 // The reporter ID of messages that are sent while no session is active.
 constexpr ReporterID kStandaloneReporterID{1};
-
-// received = delivered + dropped + refused.
-struct MessageCounters {
-  platform::Counter& received;
-  platform::Counter& delivered;
-  platform::Counter& noSession;
-  platform::Counter& disabled;
-};
-
-const MessageCounters& counters() {
-  constexpr std::string_view kPiece = "messages";
-  platform::StatisticsService& statistics = platform::statistics();
-  static const MessageCounters made{statistics.counter(kPiece, "received"),
-                                    statistics.counter(kPiece, "delivered"),
-                                    statistics.counter(kPiece, "dropped: no session found"),
-                                    statistics.counter(kPiece, "refused: reporting disabled")};
-  return made;
-}
 
 // Describes the reporter IDs of a request for a log line.
 class ReporterIDsDescription {
@@ -77,10 +58,10 @@ void stamp(platform::Message& message) {
 void HVReportingClientServerInstance::carryOutSend(MessageRequest& request) {
   kServiceLog.debug("sending message for reporter ", ReporterIDsDescription(request.reporterIDs));
   emitTracePoint(ReportingTracePoint::kSendRequest);
-  counters().received.add();
+  counters_->messages.received.add();
   const Delegate delegate = delegate_.lock();
   if (delegate == nullptr || !delegate->isReportingEnabled()) {
-    counters().disabled.add();
+    counters_->messages.disabled.add();
     request.reply(platform::Error{.domain = std::string(kErrorDomain), .code = kReportingDisabled});
     return;
   }
@@ -106,7 +87,7 @@ void HVReportingClientServerInstance::sendToNamedSessions(const MessageRequest& 
     session->sendMessage(request.message, request.category, request.type, nullptr, account_);
     delivered = true;
   }
-  (delivered ? counters().delivered : counters().noSession).add();
+  (delivered ? counters_->messages.delivered : counters_->messages.noSession).add();
 }
 
 void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest& request,
@@ -114,7 +95,7 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
   const auto sessions = delegate->getAllActiveReportingSessions();
   kServiceLog.notice("active reporting sessions ", sessions.size(), " : ",
                      sessionsDescription(sessions));
-  counters().delivered.add();
+  counters_->messages.delivered.add();
   if (sessions.empty()) {
     sendStandalone(request, delegate);
     return;
@@ -132,7 +113,8 @@ void HVReportingClientServerInstance::sendStandalone(const MessageRequest& reque
   // and enters no map; the queued payloads hold it until they are built.
   const auto session = std::make_shared<HVReportingSession>(
       kStandaloneReporterID,
-      HVReportingSession::ProcessIdentifiers{platform::process().ownProcessIdentifier()});
+      HVReportingSession::ProcessIdentifiers{platform::process().ownProcessIdentifier()},
+      counters_->sessions);
   session->setServiceType(AudioServiceType::kStandalone);
   session->updateConfigurationWithContentsOfConfiguration(
       {{"HostApplicationDisplayID", "Unknown"}});
@@ -140,17 +122,17 @@ void HVReportingClientServerInstance::sendStandalone(const MessageRequest& reque
   kServiceLog.notice("no active reporting sessions found, sending as standalone");
   HVReportingSession::sendSingleMessage(request.message, request.category, request.type,
                                         AudioServiceType::kStandalone, delegate->getDefaults(),
-                                        nullptr, account_);
+                                        nullptr, account_, *counters_->sessions);
 }
 
 // The order is required. Each back-end ignores the messages that do not concern it.
 void HVReportingClientServerInstance::handToBackEnds(const MessageRequest& request,
                                                      const Session& session,
-                                                     const Delegate& delegate) {
+                                                     const Delegate& delegate) const {
   const auto& [message, category, type, ids, senderName, reply, charge] = request;
   HVReportingTallyhubBridge::handleEvent(message, category, type, session);
-  HVReportingJoulebookUtility::handleEvent(message, category, type, session);
-  HVReportingZUBBridge::handleEvent(message, category, type, session);
+  HVReportingJoulebookUtility::handleEvent(message, category, type, session, counters_->powerLog);
+  HVReportingZUBBridge::handleEvent(message, category, type, session, counters_->issueMetrics);
   delegate->handleEventForVEK(message, category, type, session, senderName);
 }
 

@@ -4,7 +4,6 @@
 #include "backends/HVReportingVocabulary.h"
 #include "platform/feature_flags.h"
 #include "platform/services.h"
-#include "platform/statistics.h"
 #include "service/HVReportingClientServerInstance.h"
 #include "service/ServiceLog.h"
 #include "session/SessionLog.h"
@@ -18,21 +17,6 @@ namespace {
 // While more sessions than this are counted as active, sessions are created and started without
 // the real-time link.
 constexpr std::int64_t kMaxSessionsWithLink = 5;
-
-// held back = delivered + waiting + dropped with their session. The session counts the dropped
-// ones.
-struct StartReplyCounters {
-  platform::Counter& heldBack;
-  platform::Counter& delivered;
-};
-
-const StartReplyCounters& startReplies() {
-  constexpr std::string_view kPiece = "start replies";
-  platform::StatisticsService& statistics = platform::statistics();
-  static const StartReplyCounters made{statistics.counter(kPiece, "held back"),
-                                       statistics.counter(kPiece, "delivered")};
-  return made;
-}
 
 using Delegate = std::shared_ptr<HVReportingServiceDelegateProtocol>;
 
@@ -51,10 +35,10 @@ void logActiveSessions(const Delegate& delegate) {
                      sessionsDescription(sessions));
 }
 
-void deliverHeldReply(HVReportingSession& session) {
+void deliverHeldReply(HVReportingSession& session, const ServiceCounters& counters) {
   const BoolReply held = session.takeTransactionCompleteBlock();
   if (!held) return;
-  startReplies().delivered.add();
+  counters.startReplies.delivered.add();
   held(std::nullopt, true);
 }
 
@@ -81,7 +65,7 @@ void HVReportingClientServerInstance::carryOutCreate(ReporterID reporterID,
   const Delegate delegate = delegate_.lock();
   // The ID is not checked: 0 and an ID in use are accepted. This is required.
   const auto session = std::make_shared<HVReportingSession>(
-      reporterID, HVReportingSession::ProcessIdentifiers{processIdentifier_});
+      reporterID, HVReportingSession::ProcessIdentifiers{processIdentifier_}, counters_->sessions);
   putSession(session, delegate);
   session->setTlmReportingEnabled(mayUseLink(delegate));
   kServiceLog.notice("session created for reporter ", number(reporterID));
@@ -147,8 +131,8 @@ void HVReportingClientServerInstance::begin(const Session& session, const Delega
   note(session, SessionChange::kStarted, delegate);
   // After the start: the report covers only what the drivers count from here on.
   if (delegate != nullptr) session->setDriverSnapShot(delegate->getSnapShot());
-  deliverHeldReply(*session);
-  startReplies().heldBack.add();
+  deliverHeldReply(*session, *counters_);
+  counters_->startReplies.heldBack.add();
   session->setTransactionCompleteBlock(reply);
   sendFeaturesState(*session, delegate);
   // A test gets its reply at once. The reply also stays stored, so it is called again when the
@@ -178,7 +162,7 @@ void HVReportingClientServerInstance::end(const Session& session, const Delegate
   session->stop();
   note(session, SessionChange::kStopped, delegate);
   addToActiveSessionCount(delegate, -1);
-  deliverHeldReply(*session);
+  deliverHeldReply(*session, *counters_);
   logActiveSessions(delegate);
 }
 

@@ -21,7 +21,8 @@ class HVReportingClientServerInstanceTest : public ServiceFixture {
 };
 
 TEST_F(HVReportingClientServerInstanceTest, ANewClientHasItsPidAndNothingElse) {
-  const HVReportingClientServerInstance client(55, delegate_);
+  const HVReportingClientServerInstance client(55, delegate_,
+                                               ServiceCounters::make(platform_.statistics));
 
   EXPECT_EQ(client.processIdentifier(), 55);
   EXPECT_EQ(client.clientStartDate(), std::nullopt);
@@ -33,7 +34,10 @@ TEST_F(HVReportingClientServerInstanceTest, ANewClientHasItsPidAndNothingElse) {
 
 TEST_F(HVReportingClientServerInstanceTest, CreationAndDestructionAreLogged) {
   forgetSteps();
-  { const HVReportingClientServerInstance client(55, delegate_); }
+  {
+    const HVReportingClientServerInstance client(55, delegate_,
+                                                 ServiceCounters::make(platform_.statistics));
+  }
 
   EXPECT_THAT(lines(LogLevel::kDefault),
               ElementsAre("new client with pid 55", "dealloc 55 from the server client list"));

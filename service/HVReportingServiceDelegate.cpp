@@ -89,12 +89,14 @@ std::vector<std::shared_ptr<HVReportingSession>> sessionsOf(
 // This order is required. The queue exists first, because notifications are delivered on it. The
 // drivers are subscribed to here, before any client can connect, and never again.
 HVReportingServiceDelegate::HVReportingServiceDelegate()
-    : defaults_((createReportingQueue(), HVReportingDefaults())), features_(makeFeatures()) {
+    : counters_(ServiceCounters::make(platform::statistics())),
+      defaults_((createReportingQueue(), HVReportingDefaults())),
+      features_(makeFeatures()) {
   listenForFeatureStateChanges();
   driverUtility_ = std::make_unique<HVReportingDriverUtility>();
   offerState();
   if (HVReportingUtilityIsInternalBuild()) {
-    vekStateManager_ = std::make_unique<HVReportingUtilityVEKStateManager>();
+    vekStateManager_ = std::make_unique<HVReportingUtilityVEKStateManager>(platform::statistics());
   }
 }
 
@@ -122,7 +124,7 @@ HVReportingServiceDelegate::Client HVReportingServiceDelegate::exportClient(
   const std::lock_guard held(lock_);
   connection.setExportedInterface(HVReportingServiceInterface());
   auto client = std::make_shared<HVReportingClientServerInstance>(connection.processIdentifier(),
-                                                                  weak_from_this());
+                                                                  weak_from_this(), counters_);
   connection.setExportedObject(client);
   return client;
 }

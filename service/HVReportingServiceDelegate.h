@@ -14,6 +14,7 @@
 #include "platform/process.h"
 #include "platform/value.h"
 #include "service/HVReportingServiceDelegateProtocol.h"
+#include "service/ServiceCounters.h"
 #include "service/SessionIndex.h"
 
 namespace halvox {
@@ -105,6 +106,7 @@ class HVReportingServiceDelegate final
   // Each is read on its own; they order nothing else.
   std::atomic<bool> reportingEnabled_{true};
   std::atomic<std::int64_t> activeSessionCount_{0};
+  const std::shared_ptr<const ServiceCounters> counters_;  // shared with the clients
   const platform::Dictionary defaults_;
   Features features_;  // does not change after construction
   std::unique_ptr<const HVReportingDriverUtility> driverUtility_;

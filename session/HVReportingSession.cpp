@@ -5,7 +5,6 @@
 #include "backends/HVReportingTallyhubBridge.h"
 #include "backends/HVReportingUtility.h"
 #include "platform/services.h"
-#include "platform/statistics.h"
 #include "session/SessionLog.h"
 #include "session/SingleMessage.h"
 #include "session/TracePoints.h"
@@ -22,20 +21,14 @@ using platform::Message;
 constexpr AudioEventCategory kSummaryCategory{0xFFFFFFFF};
 constexpr AudioEventType kSummaryType = AudioEventType::kUnknown;
 
-// Counts the replies to starts that are never sent, because the session is destroyed before it has
-// been stopped.
-platform::Counter& startRepliesDropped() {
-  static platform::Counter& counter =
-      platform::statistics().counter("start replies", "dropped: session released");
-  return counter;
-}
-
 }  // namespace
 
-HVReportingSession::HVReportingSession(ReporterID reporterID, ProcessIdentifiers processIdentifiers)
-    : profile_(reporterID, std::move(processIdentifiers), held_),
+HVReportingSession::HVReportingSession(ReporterID reporterID, ProcessIdentifiers processIdentifiers,
+                                       Counters counters)
+    : counters_(std::move(counters)),
+      profile_(reporterID, std::move(processIdentifiers), held_),
       history_(held_),
-      link_(profile_, held_),
+      link_(profile_, held_, *counters_),
       tracing_(profile_),
       summary_(profile_, history_) {
   kSessionLog.info("created reporting session for ID: ", number(reporterID));
@@ -47,7 +40,7 @@ HVReportingSession::HVReportingSession(ReporterID reporterID, ProcessIdentifiers
 HVReportingSession::~HVReportingSession() {
   emitTracePoint(ReportingTracePoint::kSessionDestroyed);
   kSessionLog.info("deallocing this session ", number(reporterID()));
-  if (transactionCompleteBlock_.take()) startRepliesDropped().add();
+  if (transactionCompleteBlock_.take()) counters_->startRepliesDropped.add();
 }
 
 void HVReportingSession::setConfiguration(const Message& configuration) {
@@ -144,7 +137,8 @@ void HVReportingSession::sendMessage(const Message& message, AudioEventCategory 
   kSessionLog.debug("sending message for session owned by ", number(reporterID()));
   const Dictionary tagged = HVReportingUtilityAddAudioMessageTag(
       HVReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(Dictionary())), category, type);
-  const bool isRedundant = history_.record(category, type, tagged);
+  const SessionHistory::Outcome outcome = history_.record(category, type, tagged);
+  count(outcome);
   emitTracePoint(ReportingTracePoint::kMessageSent);
   // Read here and not in the link's job: by the time the job runs, the session may have been
   // stopped or started again. Read after the message was recorded; this order is required.
@@ -155,18 +149,31 @@ void HVReportingSession::sendMessage(const Message& message, AudioEventCategory 
                                       .category = category,
                                       .type = type,
                                       .wasStarted = wasStarted,
-                                      .isRedundant = isRedundant,
+                                      .isRedundant = outcome == SessionHistory::Outcome::kRedundant,
                                       .sender = sender != nullptr ? sender : held_.account()});
   }
   // The sender does not wait for the link and never hears of its failures.
   if (reply) reply(std::nullopt);
 }
 
+void HVReportingSession::count(SessionHistory::Outcome outcome) const {
+  const SessionCounters::Messages& messages = counters_->messages;
+  messages.received.add();
+  switch (outcome) {
+    case SessionHistory::Outcome::kRecorded:
+      return messages.recorded.add();
+    case SessionHistory::Outcome::kRedundant:
+      return messages.redundant.add();
+    case SessionHistory::Outcome::kNotStarted:
+      return messages.notStarted.add();
+  }
+}
+
 void HVReportingSession::sendSingleMessage(const Message& message, AudioEventCategory category,
                                            AudioEventType type, AudioServiceType serviceType,
                                            const Dictionary& /*userInfo*/, const ErrorReply& reply,
-                                           const Account& sender) {
-  submitSingleMessage({message, category, type, serviceType}, reply, sender);
+                                           const Account& sender, const SessionCounters& counters) {
+  submitSingleMessage({message, category, type, serviceType}, reply, sender, counters.single);
 }
 
 }  // namespace halvox

@@ -9,6 +9,7 @@
 
 #include "session/DriverSnapShot.h"
 #include "session/ReplyCallbacks.h"
+#include "session/SessionCounters.h"
 #include "session/SessionHistory.h"
 #include "session/SessionLink.h"
 #include "session/SessionProfile.h"
@@ -40,9 +41,12 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
  public:
   using ProcessIdentifiers = SessionProfile::ProcessIdentifiers;
   using Account = std::shared_ptr<ResourceAccount>;
+  using Counters = std::shared_ptr<const SessionCounters>;
   using HistoryLock = SessionHistory::Lock;
 
-  HVReportingSession(ReporterID reporterID, ProcessIdentifiers processIdentifiers);
+  // `counters` are shared by all sessions.
+  HVReportingSession(ReporterID reporterID, ProcessIdentifiers processIdentifiers,
+                     Counters counters);
   HVReportingSession(const HVReportingSession&) = delete;
   HVReportingSession& operator=(const HVReportingSession&) = delete;
   ~HVReportingSession();
@@ -147,7 +151,7 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   static void sendSingleMessage(const platform::Message& message, AudioEventCategory category,
                                 AudioEventType type, AudioServiceType serviceType,
                                 const platform::Dictionary& userInfo, const ErrorReply& reply,
-                                const Account& sender = nullptr);
+                                const Account& sender, const SessionCounters& counters);
 
   // The message history of the current run, locked. The lock also guards the counts of identifiers.
   [[nodiscard]] HistoryLock nestedAggregatedPayloadData() const { return history_.lock(); }
@@ -157,14 +161,17 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   bool createMessageIdentifierWithCategory(const HistoryLock& history, AudioEventCategory category,
                                            AudioEventType type,
                                            const platform::Dictionary& message) {
-    return history_.recordLocked(history, category, type, message);
+    return history_.recordLocked(history, category, type, message) ==
+           SessionHistory::Outcome::kRedundant;
   }
 
  private:
   void sendVolumeMessages();
   void sendSummaryEvent();
+  void count(SessionHistory::Outcome outcome) const;
 
   // Members that others refer to come first: destruction runs backwards.
+  const Counters counters_;
   ResourceTally held_;
   SessionProfile profile_;
   SessionHistory history_;

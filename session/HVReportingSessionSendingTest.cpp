@@ -47,7 +47,8 @@ class HVReportingSessionSendingTest : public testing::Test {
 
   platform::FakePlatform platform_;
   std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
-      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12},
+      SessionCounters::make(platform_.statistics));
 };
 
 TEST_F(HVReportingSessionSendingTest, LogsThenEmitsItsTracePoint) {

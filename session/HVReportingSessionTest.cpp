@@ -25,9 +25,10 @@ constexpr ReporterID kReporter{7};
 
 class HVReportingSessionTest : public testing::Test {
  protected:
-  static std::shared_ptr<HVReportingSession> makeSession(
-      HVReportingSession::ProcessIdentifiers pids = {12, 13}) {
-    return std::make_shared<HVReportingSession>(kReporter, std::move(pids));
+  std::shared_ptr<HVReportingSession> makeSession(HVReportingSession::ProcessIdentifiers pids = {
+                                                      12, 13}) {
+    return std::make_shared<HVReportingSession>(kReporter, std::move(pids),
+                                                SessionCounters::make(platform_.statistics));
   }
   static void send(HVReportingSession& session, int value) {
     session.sendMessage(Dictionary{{"a", value}}, AudioEventCategory::kPlayback,

@@ -95,7 +95,8 @@ class LinkFixture : public testing::Test {
   platform::FakePlatform platform_;
   Fake& framework_ = platform_.tlmReporting;
   std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
-      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12});
+      ReporterID{7}, HVReportingSession::ProcessIdentifiers{12},
+      SessionCounters::make(platform_.statistics));
 };
 
 }  // namespace halvox::link_test

@@ -1,31 +1,9 @@
 #include "session/SessionHistory.h"
 
-#include <string_view>
-
-#include "platform/services.h"
-#include "platform/statistics.h"
 #include "session/SessionLog.h"
 
 namespace halvox {
 namespace {
-
-// received = recorded + suppressed + not recorded.
-struct MessageCounters {
-  platform::Counter& received;
-  platform::Counter& recorded;
-  platform::Counter& redundant;
-  platform::Counter& notStarted;
-};
-
-const MessageCounters& counters() {
-  constexpr std::string_view kPiece = "session";
-  platform::StatisticsService& statistics = platform::statistics();
-  static const MessageCounters made{statistics.counter(kPiece, "received"),
-                                    statistics.counter(kPiece, "recorded"),
-                                    statistics.counter(kPiece, "suppressed: redundant"),
-                                    statistics.counter(kPiece, "not recorded: not started")};
-  return made;
-}
 
 // Errors are never suppressed, however often they repeat. The category is compared as a whole, so
 // an error category with a domain is not exempt; this is required.
@@ -49,22 +27,11 @@ std::size_t SessionHistory::size() const {
   return history->has_value() ? (*history)->size() : 0;
 }
 
-bool SessionHistory::record(AudioEventCategory category, AudioEventType type,
-                            const platform::Dictionary& message) {
-  counters().received.add();
-  const Lock history = lock();
-  const bool isRedundant = recordLocked(history, category, type, message);
-  if (isRedundant) {
-    counters().redundant.add();
-  } else {
-    (history->has_value() ? counters().recorded : counters().notStarted).add();
-  }
-  return isRedundant;
-}
-
-bool SessionHistory::recordLocked(const Lock& history, AudioEventCategory category,
-                                  AudioEventType type, const platform::Dictionary& message) {
-  if (!history->has_value()) return false;
+SessionHistory::Outcome SessionHistory::recordLocked(const Lock& history,
+                                                     AudioEventCategory category,
+                                                     AudioEventType type,
+                                                     const platform::Dictionary& message) {
+  if (!history->has_value()) return Outcome::kNotStarted;
   MessageHistory& messages = **history;
   const std::size_t before = messages.memorySize();
   MessageHistory::Base& base = messages.base(category, type);
@@ -77,11 +44,11 @@ bool SessionHistory::recordLocked(const Lock& history, AudioEventCategory catego
     kSessionLog.debug("dropping redundant event");
     // Nothing was recorded, but the table of codes may have grown.
     held_.change(before, messages.memorySize());
-    return true;
+    return Outcome::kRedundant;
   }
   messages.append(base, message);
   held_.change(before, messages.memorySize());
-  return false;
+  return Outcome::kRecorded;
 }
 
 }  // namespace halvox

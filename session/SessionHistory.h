@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdint>
 #include <optional>
 
 #include "backends/HVReportingVocabulary.h"
@@ -21,6 +22,9 @@ class SessionHistory {
   // The history, locked. Holds none outside a run.
   using Lock = Guarded<std::optional<MessageHistory>>::Lock;
 
+  // What became of a message.
+  enum class Outcome : std::uint8_t { kRecorded, kRedundant, kNotStarted };
+
   // Charges the history to `held`, which must outlive this.
   explicit SessionHistory(ResourceTally& held) : held_(held) {}
 
@@ -35,12 +39,14 @@ class SessionHistory {
   [[nodiscard]] std::size_t size() const;
 
   // Records a message under its next identifier, unless it repeats the previous message of its
-  // category and type. Returns true if the message was such a repetition. Counts the outcome.
-  bool record(AudioEventCategory category, AudioEventType type,
-              const platform::Dictionary& message);
-  // The same for a caller that holds the lock; not counted. Outside a run returns false.
-  bool recordLocked(const Lock& history, AudioEventCategory category, AudioEventType type,
-                    const platform::Dictionary& message);
+  // category and type.
+  Outcome record(AudioEventCategory category, AudioEventType type,
+                 const platform::Dictionary& message) {
+    return recordLocked(lock(), category, type, message);
+  }
+  // The same for a caller that holds the lock.
+  Outcome recordLocked(const Lock& history, AudioEventCategory category, AudioEventType type,
+                       const platform::Dictionary& message);
 
  private:
   ResourceTally& held_;  // the session's

@@ -10,6 +10,7 @@ namespace halvox {
 namespace {
 
 using platform::Dictionary;
+using Outcome = SessionHistory::Outcome;
 
 constexpr auto kPlayback = AudioEventCategory::kPlayback;
 constexpr auto kStart = AudioEventType::kStart;
@@ -25,8 +26,8 @@ class SessionHistoryTest : public testing::Test {
 };
 
 TEST_F(SessionHistoryTest, OutsideARunRecordsNothing) {
-  EXPECT_FALSE(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}));
-  EXPECT_FALSE(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}));
+  EXPECT_EQ(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}), Outcome::kNotStarted);
+  EXPECT_EQ(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}), Outcome::kNotStarted);
 
   EXPECT_EQ(history_.size(), 0U);
   EXPECT_FALSE(history_.lock()->has_value());
@@ -36,8 +37,8 @@ TEST_F(SessionHistoryTest, OutsideARunRecordsNothing) {
 TEST_F(SessionHistoryTest, RepetitionInARunIsRedundant) {
   history_.begin();
 
-  EXPECT_FALSE(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}));
-  EXPECT_TRUE(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}));
+  EXPECT_EQ(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}), Outcome::kRecorded);
+  EXPECT_EQ(history_.record(kPlayback, kStart, Dictionary{{"a", 1}}), Outcome::kRedundant);
 
   EXPECT_EQ(history_.size(), 1U);
 }

@@ -6,7 +6,6 @@
 
 #include "backends/HVReportingUtility.h"
 #include "platform/services.h"
-#include "platform/statistics.h"
 #include "session/LinkDiscovery.h"
 #include "session/LinkInfo.h"
 #include "session/LinkLog.h"
@@ -26,32 +25,6 @@ constexpr std::string_view kQueueLabel = "com.tarno.halvox.session.tlmreporting"
 constexpr std::chrono::seconds kBackendTimeOut{9};
 // Estimated bytes of a waiting job and its place in the queue, in addition to its content.
 constexpr std::size_t kWaitingOverhead = 256;
-
-// received = sent + failed + single + suppressed + dropped + the messages that wait in the queues.
-struct LinkCounters {
-  platform::Counter& received;
-  platform::Counter& sent;
-  platform::Counter& failed;
-  platform::Counter& single;
-  platform::Counter& redundant;
-  platform::Counter& notAllowed;
-  platform::Counter& testSession;
-  platform::Counter& noBackend;
-};
-
-const LinkCounters& counters() {
-  constexpr std::string_view kPiece = "link";
-  platform::StatisticsService& statistics = platform::statistics();
-  static const LinkCounters made{statistics.counter(kPiece, "received"),
-                                 statistics.counter(kPiece, "sent"),
-                                 statistics.counter(kPiece, "failed"),
-                                 statistics.counter(kPiece, "handed on: single message"),
-                                 statistics.counter(kPiece, "suppressed: redundant"),
-                                 statistics.counter(kPiece, "dropped: transactions not allowed"),
-                                 statistics.counter(kPiece, "dropped: test session"),
-                                 statistics.counter(kPiece, "dropped: no back-end")};
-  return made;
-}
 
 // A test session never reaches the framework; this is required.
 bool mayUseFramework(AudioServiceType serviceType) {
@@ -190,7 +163,7 @@ void SessionLink::endStop() {
 // prevent other clients from sending. Nothing is dropped here to save memory. Instead, the sender's
 // next requests are refused while its account is over the limit, before they are answered.
 void SessionLink::submit(const Owner& owner, LinkMessage message) {
-  counters().received.add();
+  counters_.link.received.add();
   ResourceCharge charge(message.sender, message.sender == nullptr ? 0 : bytesOf(message));
   tlmReportingQueue()->async(
       JobWeight::kMayBlock,
@@ -213,22 +186,22 @@ void SessionLink::sendThroughFramework(const LinkMessage& message) {
       HVReportingUtilityRetrieveTLMReportingCategoryFromCategory(message.category);
   const auto open = tlmReportingSession();
   // The order of these tests decides under which reason a message is counted.
-  if (!HVReportingUtilityAllowSessionTransactions()) return counters().notAllowed.add();
-  if (profile_.serviceType() == AudioServiceType::kTest) return counters().testSession.add();
-  if (message.isRedundant) return counters().redundant.add();
-  if (open == nullptr || !tlmReportingSessionStarted()) return counters().noBackend.add();
+  if (!HVReportingUtilityAllowSessionTransactions()) return counters_.link.notAllowed.add();
+  if (profile_.serviceType() == AudioServiceType::kTest) return counters_.link.testSession.add();
+  if (message.isRedundant) return counters_.link.redundant.add();
+  if (open == nullptr || !tlmReportingSessionStarted()) return counters_.link.noBackend.add();
 
   const platform::TLMReportingOutcome outcome = platform::tlmReporting().TLMReportingSendMessage(
       open, {.category = category, .type = number(message.type), .payload = message.tagged});
   if (outcome.sent) {
-    counters().sent.add();
+    counters_.link.sent.add();
     // The line shows the message without its tag and the category with its domain. The framework
     // got the tag but not the domain. All of this is required.
     kSessionLog.debug("TLMReportingAgent ", *open, " : message ", message.original, " : category ",
                       number(message.category), " : type ", number(message.type));
     return;
   }
-  counters().failed.add();
+  counters_.link.failed.add();
   // A failure without an error is only counted; this is required.
   if (outcome.error.has_value()) {
     kSessionLog.error("error sending message ", outcome.error->description);
@@ -238,9 +211,9 @@ void SessionLink::sendThroughFramework(const LinkMessage& message) {
 // Uses the service type of this moment, not the one of the moment of sending; this is required.
 void SessionLink::sendAsSingleMessage(const LinkMessage& message) const {
   kSessionLog.debug("session not started, will send as a single message");
-  counters().single.add();
+  counters_.link.single.add();
   submitSingleMessage({message.tagged, message.category, message.type, profile_.serviceType()},
-                      nullptr, message.sender);
+                      nullptr, message.sender, counters_.single);
 }
 
 }  // namespace halvox

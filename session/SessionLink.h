@@ -11,6 +11,7 @@
 #include "platform/value.h"
 #include "session/Guarded.h"
 #include "session/ResourceAccount.h"
+#include "session/SessionCounters.h"
 
 namespace halvox {
 
@@ -48,10 +49,11 @@ class SessionLink {
  public:
   using Owner = std::shared_ptr<const HVReportingSession>;
 
-  // Reads `profile` in its jobs and charges waiting starts and stops to the account of `held`; both
-  // must outlive the link.
-  SessionLink(const SessionProfile& profile, const ResourceTally& held)
-      : profile_(profile), held_(held) {}
+  // Reads `profile` in its jobs, charges waiting starts and stops to the account of `held`, and
+  // counts in `counters`; all three must outlive the link.
+  SessionLink(const SessionProfile& profile, const ResourceTally& held,
+              const SessionCounters& counters)
+      : profile_(profile), held_(held), counters_(counters) {}
   SessionLink(const SessionLink&) = delete;
   SessionLink& operator=(const SessionLink&) = delete;
   ~SessionLink() = default;
@@ -100,11 +102,13 @@ class SessionLink {
   // Runs on the framework's thread or on the discovery's queue.
   void onBackendsFound(bool found);
 
-  const SessionProfile& profile_;  // the session's
-  const ResourceTally& held_;      // the session's
+  const SessionProfile& profile_;    // the session's
+  const ResourceTally& held_;        // the session's
+  const SessionCounters& counters_;  // held by the session
+  // Next to each other because each takes half a word: a service may have 10,000 sessions.
   std::once_flag queueMade_;
-  std::shared_ptr<platform::DispatchQueue> queue_;
   std::once_flag backendSemaphoreMade_;
+  std::shared_ptr<platform::DispatchQueue> queue_;
   std::shared_ptr<platform::DispatchSemaphore> backendSemaphore_;
   Guarded<platform::TLMReportingService::Session> tlmReportingSession_;
   Guarded<platform::TLMReportingService::Token> tlmReportingAgentToken_;

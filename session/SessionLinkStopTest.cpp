@@ -131,7 +131,8 @@ TEST_F(SessionLinkStopTest, ASessionThatWaitsDelaysNoOther) {
   start();
   framework_.answerDiscoveries(Fake::Answering::kLater, kServers);
   const auto other =
-      std::make_shared<HVReportingSession>(ReporterID{8}, HVReportingSession::ProcessIdentifiers{});
+      std::make_shared<HVReportingSession>(ReporterID{8}, HVReportingSession::ProcessIdentifiers{},
+                                           SessionCounters::make(platform_.statistics));
   other->setTlmReportingEnabled(true);
 
   other->start();

@@ -218,7 +218,8 @@ TEST_F(SessionTracingFrameworkTest, NothingRecordsForADestroyedSession) {
     session_->stop();
 
     session_ = std::make_shared<HVReportingSession>(ReporterID{8},
-                                                    HVReportingSession::ProcessIdentifiers{12});
+                                                    HVReportingSession::ProcessIdentifiers{12},
+                                                    SessionCounters::make(platform_.statistics));
     letRun();
 
     EXPECT_EQ(platform_.ktrace.recordings() + platform_.performanceTraces.recordings(), 0U);

@@ -8,7 +8,6 @@
 #include "backends/HVReportingUtility.h"
 #include "platform/dispatch.h"
 #include "platform/services.h"
-#include "platform/statistics.h"
 #include "platform/tlm_reporting.h"
 #include "session/LinkInfo.h"
 #include "session/SessionLog.h"
@@ -26,23 +25,6 @@ constexpr int kMaxAlarmDelta = 59;
 // Estimated bytes of a waiting message's job and timer, in addition to its content.
 constexpr std::size_t kPendingOverhead = 256;
 
-// received = sent + failed + suppressed + the messages that still wait for their second.
-struct SingleMessageCounters {
-  platform::Counter& received;
-  platform::Counter& sent;
-  platform::Counter& failed;
-  platform::Counter& sampled;
-};
-
-const SingleMessageCounters& counters() {
-  constexpr std::string_view kPiece = "single messages";
-  platform::StatisticsService& statistics = platform::statistics();
-  static const SingleMessageCounters made{
-      statistics.counter(kPiece, "received"), statistics.counter(kPiece, "sent"),
-      statistics.counter(kPiece, "failed"), statistics.counter(kPiece, "suppressed: sampled")};
-  return made;
-}
-
 // Alarms go off on many devices at the same moment, and the delta would spread their messages. It
 // is only logged: every message waits exactly one second. This is required.
 std::int64_t drawDelta(AudioServiceType serviceType) {
@@ -55,7 +37,8 @@ std::int64_t drawDelta(AudioServiceType serviceType) {
 
 // Sends the message. Returns the framework's error, or none if it sent the message or gave no
 // reason.
-std::optional<platform::Error> handOver(const SingleMessage& single) {
+std::optional<platform::Error> handOver(const SingleMessage& single,
+                                        const SessionCounters::SingleMessages& counters) {
   const Dictionary sessionInfo{
       {platform::kTLMReportingSessionInfoClientType, kLinkClientType},
       {platform::kTLMReportingSessionInfoClientVersion, kHVReportingVersionNumber},
@@ -74,26 +57,27 @@ std::optional<platform::Error> handOver(const SingleMessage& single) {
        .type = number(single.type),
        .payload = payload});
   if (outcome.sent) {
-    counters().sent.add();
+    counters.sent.add();
     kSessionLog.debug("message ", single.message, " : category ", number(single.category),
                       " : type ", number(single.type));
     return std::nullopt;
   }
-  counters().failed.add();
+  counters.failed.add();
   if (outcome.error.has_value()) {
     kSessionLog.error("sendOneMessageWithSessionInfo ", outcome.error->description);
   }
   return std::move(outcome.error);
 }
 
-void sendNow(const SingleMessage& single, const ErrorReply& reply) {
+void sendNow(const SingleMessage& single, const ErrorReply& reply,
+             const SessionCounters::SingleMessages& counters) {
   emitTracePoint(ReportingTracePoint::kMessageSent);
   kSessionLog.debug("sending single message");
   std::optional<platform::Error> error;
   if (HVReportingUtilityShouldSendMessage()) {
-    error = handOver(single);
+    error = handOver(single, counters);
   } else {
-    counters().sampled.add();
+    counters.sampled.add();
     kSessionLog.info("event sampled ", single.message);
   }
   if (reply) reply(error);
@@ -106,8 +90,9 @@ void sendNow(const SingleMessage& single, const ErrorReply& reply) {
 // 1 MiB from one client made it drop all 10 messages of another. Now the sender's account bounds
 // them: over its limit, the sender's next requests are refused.
 void submitSingleMessage(SingleMessage single, ErrorReply reply,
-                         const std::shared_ptr<ResourceAccount>& sender) {
-  counters().received.add();
+                         const std::shared_ptr<ResourceAccount>& sender,
+                         const SessionCounters::SingleMessages& counters) {
+  counters.received.add();
   kSessionLog.debug("sending single message after delta ", drawDelta(single.serviceType),
                     " for service ", number(single.serviceType));
   const std::size_t content = single.message.has_value() ? single.message->memorySize() : 0;
@@ -115,8 +100,10 @@ void submitSingleMessage(SingleMessage single, ErrorReply reply,
   // The background pool is small and shared. The job does not hold it up, because the framework
   // never waits for a server.
   platform::dispatch().asyncAfterOnBackgroundQueue(
-      kSingleMessageDelay, [single = std::move(single), reply = std::move(reply),
-                            charge = std::move(charge)] { sendNow(single, reply); });
+      kSingleMessageDelay,
+      [single = std::move(single), reply = std::move(reply), charge = std::move(charge), counters] {
+        sendNow(single, reply, counters);
+      });
 }
 
 }  // namespace halvox

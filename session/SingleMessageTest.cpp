@@ -11,6 +11,7 @@
 
 #include "platform/fake/FakePlatform.h"
 #include "session/HVReportingSession.h"
+#include "session/SessionCounters.h"
 
 namespace halvox {
 namespace {
@@ -27,11 +28,11 @@ class SingleMessageTest : public testing::Test {
  protected:
   ~SingleMessageTest() override { platform_.dispatch.clear(); }
 
-  static void send(AudioServiceType serviceType, const Dictionary& message = {{"a", 1}},
-                   const ErrorReply& reply = nullptr) {
+  void send(AudioServiceType serviceType, const Dictionary& message = {{"a", 1}},
+            const ErrorReply& reply = nullptr) {
     HVReportingSession::sendSingleMessage(message, AudioEventCategory::kPlayback,
                                           AudioEventType::kStart, serviceType, {{"ignored", true}},
-                                          reply);
+                                          reply, nullptr, counters_);
   }
   static int delta(const std::string& line) {
     int value = -1;
@@ -41,6 +42,7 @@ class SingleMessageTest : public testing::Test {
   }
 
   platform::FakePlatform platform_;
+  const SessionCounters counters_{platform_.statistics};
 };
 
 TEST_F(SingleMessageTest, LogsADeltaOfZeroForOtherServicesThanAlarms) {
@@ -146,7 +148,7 @@ TEST_F(SingleMessageTest, NamesTheServiceInItsUserInfoAndNothingElseOfTheSession
 TEST_F(SingleMessageTest, SendsCleanKeysAndTheCategoryWithoutItsDomain) {
   HVReportingSession::sendSingleMessage(
       Dictionary{{"sample rate", 48000}}, AudioEventCategory::kToolbox | AudioEventCategory::kError,
-      AudioEventType::kState, AudioServiceType::kHaptics, {}, nullptr);
+      AudioEventType::kState, AudioServiceType::kHaptics, {}, nullptr, nullptr, counters_);
   platform_.dispatch.advance(1s);
 
   const auto sent = platform_.tlmReporting.singleMessages();
@@ -161,7 +163,7 @@ TEST_F(SingleMessageTest, SendsCleanKeysAndTheCategoryWithoutItsDomain) {
 TEST_F(SingleMessageTest, NoMessageAtAllIsSentEmpty) {
   HVReportingSession::sendSingleMessage(std::nullopt, AudioEventCategory::kPlayback,
                                         AudioEventType::kStart, AudioServiceType::kHaptics, {},
-                                        nullptr);
+                                        nullptr, nullptr, counters_);
   platform_.dispatch.advance(1s);
 
   ASSERT_EQ(platform_.tlmReporting.singleMessages().size(), 1U);
@@ -212,7 +214,7 @@ TEST_F(SingleMessageTest, IsChargedToItsSenderUntilTheFrameworkTookIt) {
 
   HVReportingSession::sendSingleMessage(Dictionary{{"a", std::string(1000, 'x')}},
                                         AudioEventCategory::kPlayback, AudioEventType::kStart,
-                                        AudioServiceType::kHaptics, {}, reply, sender);
+                                        AudioServiceType::kHaptics, {}, reply, sender, counters_);
   const std::uint64_t whileWaiting = sender->use().bytes;
   platform_.dispatch.advance(1s);
 
@@ -226,7 +228,7 @@ TEST_F(SingleMessageTest, IsSentAfterItsSenderHasLeft) {
   const std::weak_ptr<ResourceAccount> watched = sender;
   HVReportingSession::sendSingleMessage(Dictionary{{"a", 1}}, AudioEventCategory::kPlayback,
                                         AudioEventType::kStart, AudioServiceType::kHaptics, {},
-                                        nullptr, sender);
+                                        nullptr, sender, counters_);
 
   sender.reset();
   EXPECT_FALSE(watched.expired());

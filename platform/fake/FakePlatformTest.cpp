@@ -153,18 +153,21 @@ TEST_F(FakePlatformTest, TerminationCallsTheHandlerAndThrows) {
   EXPECT_EQ(platform_.process.terminations(), std::vector<int>{2});
 }
 
-TEST_F(FakePlatformTest, CountersLiveOnButEachFakeCountsFromNought) {
+TEST_F(FakePlatformTest, CountersAreKeptAndCountFromZeroAfterAClear) {
   Counter& counter = statistics().counter("piece", "name");
   counter.add(3);
   EXPECT_EQ(platform_.statistics.value("piece", "name"), 3U);
   EXPECT_EQ(&statistics().counter("piece", "name"), &counter);
 
-  const FakeStatisticsService next;
+  platform_.statistics.clear();
   counter.add(2);
 
-  EXPECT_EQ(next.value("piece", "name"), 2U);
-  EXPECT_EQ(next.values("piece"), (std::map<std::string, std::uint64_t>{{"name", 2}}));
-  EXPECT_EQ(next.value("piece", "unknown"), 0U);
+  EXPECT_EQ(&statistics().counter("piece", "name"), &counter);
+  EXPECT_EQ(platform_.statistics.value("piece", "name"), 2U);
+  EXPECT_EQ(platform_.statistics.values("piece"),
+            (std::map<std::string, std::uint64_t>{{"name", 2}}));
+  EXPECT_EQ(platform_.statistics.value("piece", "unknown"), 0U);
+  EXPECT_EQ(FakeStatisticsService().value("piece", "name"), 0U);
 }
 
 TEST(FakePlatformLifeTest, WhatItDropsMayStillUseAllServices) {

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <string>
 #include <thread>
 #include <vector>
 
@@ -32,8 +33,6 @@ TYPED_TEST_P(StatisticsContract, OtherNamesGiveOtherCounters) {
 }
 
 TYPED_TEST_P(StatisticsContract, CountsOfAllThreadsAddUp) {
-  const std::uint64_t before = this->service_.counter("contract", "received").value();
-
   std::vector<std::thread> threads;
   threads.reserve(4);
   for (int thread = 0; thread < 4; ++thread) {
@@ -45,10 +44,35 @@ TYPED_TEST_P(StatisticsContract, CountsOfAllThreadsAddUp) {
   }
   for (std::thread& thread : threads) thread.join();
 
-  EXPECT_EQ(this->service_.counter("contract", "received").value() - before, 4000U);
+  EXPECT_EQ(this->service_.counter("contract", "received").value(), 4000U);
+}
+
+TYPED_TEST_P(StatisticsContract, CountersStayWhereTheyAreWhileOthersAreMade) {
+  Counter& counter = this->service_.counter("contract", "received");
+  counter.add();
+
+  for (int other = 0; other < 1000; ++other) {
+    this->service_.counter("contract", "other " + std::to_string(other)).add();
+  }
+
+  EXPECT_EQ(&this->service_.counter("contract", "received"), &counter);
+  EXPECT_EQ(counter.value(), 1U);
+}
+
+TYPED_TEST_P(StatisticsContract, EachServiceHasCountersOfItsOwn) {
+  this->service_.counter("contract", "received").add();
+
+  TypeParam other;
+  Counter& counter = other.counter("contract", "received");
+  EXPECT_EQ(counter.value(), 0U);
+  counter.add(2);
+
+  EXPECT_EQ(this->service_.counter("contract", "received").value(), 1U);
 }
 
 REGISTER_TYPED_TEST_SUITE_P(StatisticsContract, SameNamesGiveTheSameCounter,
-                            OtherNamesGiveOtherCounters, CountsOfAllThreadsAddUp);
+                            OtherNamesGiveOtherCounters, CountsOfAllThreadsAddUp,
+                            CountersStayWhereTheyAreWhileOthersAreMade,
+                            EachServiceHasCountersOfItsOwn);
 
 }  // namespace halvox::platform::contract
