@@ -172,6 +172,13 @@ class ConnectionContract : public ::testing::Test {
     client.post(method, text);
     return client.answer().value_or(ContractAnswer{.text = "none came", .errorName = {}});
   }
+  // Waits until the object keeps the answer to a request "keep".
+  bool letKeepOne() {
+    return harness_.letHappen([this] {
+      const auto object = delegate_.object();
+      return object != nullptr && object->keepsOne();
+    });
+  }
 
   Harness harness_;
   ContractDelegate delegate_;
@@ -237,10 +244,7 @@ TYPED_TEST_P(ConnectionContract, RequestNamesItsSenderAndHasATokenOfItsOwn) {
 TYPED_TEST_P(ConnectionContract, LateAnswerOfAnotherThreadReachesTheClient) {
   auto client = this->connect();
   client.post("keep", "a");
-  ASSERT_TRUE(this->harness_.letHappen([&] {
-    const auto object = this->delegate_.object();
-    return object != nullptr && object->keepsOne();
-  }));
+  ASSERT_TRUE(this->letKeepOne());
 
   this->delegate_.object()->answerKept("late");
 
@@ -252,10 +256,7 @@ TYPED_TEST_P(ConnectionContract, LateAnswerOfAnotherThreadReachesTheClient) {
 TYPED_TEST_P(ConnectionContract, AnswerToAClientThatHasGoneDoesNothing) {
   auto client = this->connect();
   client.post("keep", "a");
-  ASSERT_TRUE(this->harness_.letHappen([&] {
-    const auto object = this->delegate_.object();
-    return object != nullptr && object->keepsOne();
-  }));
+  ASSERT_TRUE(this->letKeepOne());
   const std::shared_ptr<ContractObject> object = this->delegate_.object();
   client.leave();
   ASSERT_TRUE(this->harness_.letHappen([&] { return this->delegate_.events().size() == 3; }));

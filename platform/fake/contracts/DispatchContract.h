@@ -12,6 +12,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/dispatch.h"
+#include "platform/fake/contracts/DispatchDrain.h"
 
 namespace halvox::platform::contract {
 
@@ -29,12 +30,7 @@ class DispatchContract : public ::testing::Test {
     return harness_.service().createSerialQueue("com.tarno.halvox.test", QualityOfService::kUtility,
                                                 threading);
   }
-  // True when all jobs that were added before have run.
-  bool drain(DispatchQueue& queue) {
-    const auto done = std::make_shared<std::atomic<bool>>(false);
-    queue.async(JobWeight::kBrief, [done] { *done = true; });
-    return harness_.letRunUntil([&done] { return done->load(); });
-  }
+  bool drain(DispatchQueue& queue) { return drainBy(harness_, queue); }
 
   static constexpr std::array kThreadings{QueueThreading::kOwnThread, QueueThreading::kShared};
   Harness harness_;

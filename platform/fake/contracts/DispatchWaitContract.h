@@ -11,6 +11,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/dispatch.h"
+#include "platform/fake/contracts/DispatchDrain.h"
 
 namespace halvox::platform::contract {
 
@@ -52,12 +53,7 @@ class DispatchWaitContract : public ::testing::Test {
   bool letEnd(int waits) {
     return harness_.letRunUntil([this, waits] { return ended_ == waits; });
   }
-  // True when all jobs that were added before have run.
-  bool drain(DispatchQueue& queue) {
-    const auto done = std::make_shared<std::atomic<bool>>(false);
-    queue.async(JobWeight::kBrief, [done] { *done = true; });
-    return harness_.letRunUntil([&done] { return done->load(); });
-  }
+  bool drain(DispatchQueue& queue) { return drainBy(harness_, queue); }
 
   static constexpr std::chrono::nanoseconds kShort = std::chrono::milliseconds(20);
   static constexpr std::chrono::nanoseconds kLong = std::chrono::hours(1);

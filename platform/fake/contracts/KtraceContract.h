@@ -66,6 +66,13 @@ class KtraceContract : public ::testing::Test {
     EXPECT_EQ(service().ktrace_events_range(session, kLow, kHigh, seeInto(seen)), 0);
     return session;
   }
+  // A session that is started and has recorded one event.
+  KtraceService::Session recordOneEvent(Seen& seen) {
+    auto session = createWithRange(seen);
+    EXPECT_EQ(start(session), 0);
+    harness_.emit({kLow});
+    return session;
+  }
   // The calls that a session's owner makes on its queue.
   void onQueue(std::function<void()> work) {
     std::atomic<bool> isDone{false};
@@ -170,9 +177,7 @@ TYPED_TEST_P(KtraceContract, RangeUpsideDownIsAnError) {
 
 TYPED_TEST_P(KtraceContract, SecondEndDoesNothing) {
   typename TestFixture::Seen seen;
-  const auto session = this->createWithRange(seen);
-  this->start(session);
-  this->harness_.emit({this->kLow});
+  const auto session = this->recordOneEvent(seen);
 
   this->onQueue([&] {
     this->service().ktrace_end(session, 0);
@@ -309,9 +314,7 @@ TYPED_TEST_P(KtraceContract, SessionsRecordBesideEachOther) {
 
 TYPED_TEST_P(KtraceContract, DestroyWhileItRecordsEndsItWithoutAWord) {
   typename TestFixture::Seen seen;
-  const auto session = this->createWithRange(seen);
-  this->start(session);
-  this->harness_.emit({this->kLow});
+  const auto session = this->recordOneEvent(seen);
 
   this->destroy(session);
   EXPECT_EQ(this->harness_.recordings(), 0U);
@@ -323,9 +326,7 @@ TYPED_TEST_P(KtraceContract, DestroyWhileItRecordsEndsItWithoutAWord) {
 
 TYPED_TEST_P(KtraceContract, DestroyBehindTheEndKeepsTheRestBack) {
   typename TestFixture::Seen seen;
-  const auto session = this->createWithRange(seen);
-  this->start(session);
-  this->harness_.emit({this->kLow});
+  const auto session = this->recordOneEvent(seen);
 
   this->onQueue([&] {
     this->service().ktrace_end(session, 0);

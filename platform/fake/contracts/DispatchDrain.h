@@ -1,0 +1,19 @@
+#pragma once
+
+#include <atomic>
+#include <memory>
+
+#include "platform/dispatch.h"
+
+namespace halvox::platform::contract {
+
+// Lets jobs run until all that were added to the queue before have run. Returns false if they never
+// do. `Harness` is that of DispatchContract.
+template <typename Harness>
+[[nodiscard]] bool drainBy(Harness& harness, DispatchQueue& queue) {
+  const auto done = std::make_shared<std::atomic<bool>>(false);
+  queue.async(JobWeight::kBrief, [done] { *done = true; });
+  return harness.letRunUntil([&done] { return done->load(); });
+}
+
+}  // namespace halvox::platform::contract
