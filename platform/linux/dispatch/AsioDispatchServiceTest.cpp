@@ -18,23 +18,14 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
-#include "platform/linux/log/QueuedLogService.h"
-#include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/dispatch/DispatchFixture.h"
 #include "platform/linux/testing/Eventually.h"
-#include "platform/linux/testing/MemoryLogSink.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
-class AsioDispatchServiceTest : public ::testing::Test {
+class AsioDispatchServiceTest : public DispatchFixture {
  protected:
-  AsioDispatchServiceTest() {
-    auto sink = std::make_unique<MemoryLogSink>();
-    sink_ = sink.get();
-    log_ = std::make_unique<QueuedLogService>(LogLevel::kDebug, std::move(sink), statistics_);
-    service_ = std::make_unique<AsioDispatchService>(*log_, statistics_);
-  }
-
   std::shared_ptr<DispatchQueue> createQueue(QueueThreading threading) {
     return service_->createSerialQueue("com.tarno.halvox.reporting.server",
                                        QualityOfService::kUserInteractive, threading);
@@ -46,12 +37,6 @@ class AsioDispatchServiceTest : public ::testing::Test {
     queue.async(JobWeight::kBrief, [&done] { done.set_value(); });
     return ran.wait_for(kTestDeadline) == std::future_status::ready;
   }
-  std::uint64_t count(const char* name) { return statistics_.counter("dispatch", name).value(); }
-
-  CounterStatisticsService statistics_;
-  MemoryLogSink* sink_ = nullptr;
-  std::unique_ptr<QueuedLogService> log_;
-  std::unique_ptr<AsioDispatchService> service_;
 };
 
 std::size_t threadsOfThisProcess() {
@@ -108,9 +93,9 @@ TEST_F(AsioDispatchServiceTest, JobThatThrowsIsLoggedAndCountedAndTheQueueGoesOn
   }
 
   EXPECT_EQ(count("jobs that failed"), 4U);
-  log_->stop();
-  EXPECT_THAT(sink_->lines(), ::testing::Contains(::testing::HasSubstr("out of luck")).Times(2));
-  EXPECT_THAT(sink_->lines(), ::testing::Contains(::testing::HasSubstr("unknown kind")).Times(2));
+  const auto lines = logLines();
+  EXPECT_THAT(lines, ::testing::Contains(::testing::HasSubstr("out of luck")).Times(2));
+  EXPECT_THAT(lines, ::testing::Contains(::testing::HasSubstr("unknown kind")).Times(2));
 }
 
 TEST_F(AsioDispatchServiceTest, ThousandsOfDelaysCostNoThread) {
@@ -225,18 +210,11 @@ TEST_F(AsioDispatchServiceTest, StopMayBeCalledAgainAndLaterJobsAreDiscarded) {
 TEST_F(AsioDispatchServiceTest, StopIsBoundedWhenAJobDoesNotEnd) {
   for (const auto threading : {QueueThreading::kOwnThread, QueueThreading::kShared}) {
     AsioDispatchService service(*log_, statistics_);
-    const auto queue = service.createSerialQueue("q", QualityOfService::kUtility, threading);
-    std::promise<void> started;
-    std::promise<void> release;
-    queue->async(JobWeight::kMayBlock, [&] {
-      started.set_value();
-      release.get_future().wait();
-    });
-    started.get_future().wait();
+    StuckQueue queue(service, "q", threading);
 
     EXPECT_FALSE(service.stop(std::chrono::milliseconds(20)));
 
-    release.set_value();
+    queue.release();
     EXPECT_TRUE(service.stop(kTestDeadline));
   }
 }

@@ -15,11 +15,8 @@
 #include <sys/resource.h>
 #include <unistd.h>
 
-#include "platform/linux/dispatch/AsioDispatchService.h"
-#include "platform/linux/log/QueuedLogService.h"
-#include "platform/linux/runtime/CounterStatisticsService.h"
+#include "platform/linux/dispatch/DispatchFixture.h"
 #include "platform/linux/testing/Eventually.h"
-#include "platform/linux/testing/MemoryLogSink.h"
 #include "platform/linux/testing/NoThreadsToHave.h"
 
 // What qualities of service and labels of queues do.
@@ -43,15 +40,8 @@ bool hasThreadNamed(const std::string& name) {
   return false;
 }
 
-class QualityOfServiceTest : public ::testing::Test {
+class QualityOfServiceTest : public DispatchFixture {
  protected:
-  QualityOfServiceTest() {
-    auto sink = std::make_unique<MemoryLogSink>();
-    sink_ = sink.get();
-    log_ = std::make_unique<QueuedLogService>(LogLevel::kDebug, std::move(sink), statistics_);
-    service_ = std::make_unique<AsioDispatchService>(*log_, statistics_);
-  }
-
   std::shared_ptr<DispatchQueue> createQueue(QualityOfService quality, QueueThreading threading) {
     return service_->createSerialQueue("com.tarno.halvox.test", quality, threading);
   }
@@ -66,15 +56,6 @@ class QualityOfServiceTest : public ::testing::Test {
                                           [&] { niceness.set_value(nicenessHere()); });
     return niceness.get_future().get();
   }
-  std::vector<std::string> logLines() {
-    log_->stop();
-    return sink_->lines();
-  }
-
-  CounterStatisticsService statistics_;
-  MemoryLogSink* sink_ = nullptr;
-  std::unique_ptr<QueuedLogService> log_;
-  std::unique_ptr<AsioDispatchService> service_;
 };
 
 TEST_F(QualityOfServiceTest, WorkOfALowerQualityRunsAtALowerPriority) {
@@ -200,18 +181,10 @@ TEST_F(QualityOfServiceTest, AFinishIsBoundedByItsLimit) {
 TEST_F(QualityOfServiceTest, AStopThatIsHeldUpNamesTheQueue) {
   for (const auto threading : {QueueThreading::kOwnThread, QueueThreading::kShared}) {
     AsioDispatchService service(*log_, statistics_);
-    const auto queue =
-        service.createSerialQueue("the stuck one", QualityOfService::kUtility, threading);
-    std::promise<void> started;
-    std::promise<void> release;
-    queue->async(JobWeight::kMayBlock, [&] {
-      started.set_value();
-      release.get_future().wait();
-    });
-    started.get_future().wait();
+    StuckQueue queue(service, "the stuck one", threading);
 
     EXPECT_FALSE(service.stop(std::chrono::milliseconds(20)));
-    release.set_value();
+    queue.release();
   }
 
   EXPECT_THAT(logLines(), Contains(HasSubstr("\"the stuck one\"")).Times(2));
