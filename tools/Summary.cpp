@@ -8,6 +8,7 @@
 #include <utility>
 #include <variant>
 
+#include "tools/ColumnWidths.h"
 #include "tools/JsonText.h"
 #include "tools/ServiceConfiguration.h"
 #include "tools/SummaryReader.h"
@@ -51,12 +52,7 @@ Row rowOf(const Session& session) {
 void printTable(const std::vector<Session>& sessions, std::ostream& out) {
   std::vector<Row> rows = {{"TIME", "APPLICATION", "SERVICE", "MESSAGES", "SECONDS", "VOLUMES"}};
   for (const Session& session : sessions) rows.push_back(rowOf(session));
-  std::array<std::size_t, std::tuple_size_v<Row>> widths{};
-  for (const Row& row : rows) {
-    for (std::size_t column = 0; column < row.size(); ++column) {
-      widths[column] = std::max(widths[column], row[column].size());
-    }
-  }
+  const auto widths = columnWidths(rows);
   for (const Row& row : rows) {
     for (std::size_t column = 0; column + 1 < row.size(); ++column) {
       out << std::left << std::setw(static_cast<int>(widths[column])) << row[column] << "  ";

@@ -24,6 +24,7 @@
 #include "platform/linux/base/ChildProcess.h"
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/tracing/PlistPropertyListService.h"
+#include "tools/ColumnWidths.h"
 #include "tools/JsonText.h"
 #include "tools/ServiceConfiguration.h"
 #include "tools/TraceResults.h"
@@ -65,12 +66,7 @@ void printTable(const TraceResults& results, std::ostream& out) {
                     microseconds(found.median), microseconds(found.percentile95),
                     microseconds(found.maximum)});
   }
-  std::array<std::size_t, std::tuple_size_v<Row>> widths{};
-  for (const Row& row : rows) {
-    for (std::size_t column = 0; column < row.size(); ++column) {
-      widths[column] = std::max(widths[column], row[column].size());
-    }
-  }
+  const auto widths = columnWidths(rows);
   for (const Row& row : rows) {
     out << row[0] << std::string(widths[0] - row[0].size(), ' ');
     for (std::size_t column = 1; column < row.size(); ++column) {
