@@ -37,6 +37,13 @@ class SqliteStoreFailureTest : public StoreFixture {
         {.time = now, .party = std::make_shared<LinkParty>(), .payload = payload});
     store->snapshots().add({.time = now, .signature = payload, .path = "/s"});
   }
+  // Stores one event and begins a transaction that reads it and does not end.
+  void holdOneEvent(Database& reader) {
+    send(1);
+    ASSERT_TRUE(allIsStored());
+    ASSERT_EQ(reader.open(database(), DatabaseAccess::kReadOnly), SQLITE_OK);
+    ASSERT_EQ(reader.execute("BEGIN; SELECT count(*) FROM analytics_events"), SQLITE_OK);
+  }
   void expectBalance() {
     EXPECT_EQ(counted("received"), counted("stored") + dropped());
     EXPECT_THAT(payloads(), SizeIs(counted("stored")));
@@ -128,11 +135,8 @@ TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileAnotherProcessLocksTheFi
 
 TEST_F(SqliteStoreFailureTest, StoresWhileAReaderHoldsAnOldSnapshot) {
   start();
-  send(1);
-  ASSERT_TRUE(allIsStored());
   Database reader;
-  ASSERT_EQ(reader.open(database(), DatabaseAccess::kReadOnly), SQLITE_OK);
-  ASSERT_EQ(reader.execute("BEGIN; SELECT count(*) FROM analytics_events"), SQLITE_OK);
+  ASSERT_NO_FATAL_FAILURE(holdOneEvent(reader));
   for (std::int64_t number = 0; number < 20'000; ++number) send(number);
   ASSERT_TRUE(allIsStored());
   EXPECT_EQ(dropped(), 0U);
@@ -144,11 +148,8 @@ TEST_F(SqliteStoreFailureTest, StoresWhileAReaderHoldsAnOldSnapshot) {
 TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhenAReaderThatNeverEndsMakesTheLogTooLarge) {
   options.maxMegabytes = 1;
   start();
-  send(1);
-  ASSERT_TRUE(allIsStored());
   Database reader;
-  ASSERT_EQ(reader.open(database(), DatabaseAccess::kReadOnly), SQLITE_OK);
-  ASSERT_EQ(reader.execute("BEGIN; SELECT count(*) FROM analytics_events"), SQLITE_OK);
+  ASSERT_NO_FATAL_FAILURE(holdOneEvent(reader));
   EXPECT_TRUE(eventually([this] {
     for (std::int64_t number = 0; number < 10'000; ++number) send(number);
     return counted("dropped: log held by a reader") > 0;
