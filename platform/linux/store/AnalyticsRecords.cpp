@@ -28,10 +28,10 @@ SqliteCode prepareAll(Database& database,
 
 AnalyticsRecords::AnalyticsRecords(EventNames& names, WriterQueue& queue,
                                    StatisticsService& statistics, std::uint64_t longestPayload)
-    : names_(names),
-      queue_(queue),
-      counters_(statistics, "analytics"),
-      longestPayload_(longestPayload) {}
+    : SpannedRecordKind(
+          {.records = "analytics_records", .spans = "analytics_spans", .piece = "analytics"}, queue,
+          statistics, longestPayload),
+      names_(names) {}
 
 void AnalyticsRecords::add(double time, std::string_view name, AnalyticsPayloadBuilder builder) {
   // Outside the queue's lock, which all senders share: the name is looked up without a lock.
@@ -40,11 +40,7 @@ void AnalyticsRecords::add(double time, std::string_view name, AnalyticsPayloadB
     event.ownName = std::make_unique<EventName>(name, true);
     event.name = event.ownName.get();
   }
-  // Before the wait for room, so that the counts show what waits.
-  counters_.addReceived();
-  if (!queue_.add([&] { queued_.push_back(std::move(event)); })) {
-    counters_.addDropped(DropReason::kClosed, 1);
-  }
+  addQueued([&] { queued_.push_back(std::move(event)); });
 }
 
 void AnalyticsRecords::takeQueued() {
@@ -58,7 +54,7 @@ void AnalyticsRecords::takeQueued() {
 SqliteCode AnalyticsRecords::prepare(Database& database) {
   // Another database may have come in the place of the last, with other numbers for the names.
   ++generation_;
-  const SqliteCode code = spans_.prepare(database);
+  const SqliteCode code = spans().prepare(database);
   if (code != SQLITE_OK) return code;
   return prepareAll(
       database,
@@ -72,15 +68,7 @@ SqliteCode AnalyticsRecords::prepare(Database& database) {
 
 void AnalyticsRecords::release() {
   statements_ = {};
-  spans_.release();
-}
-
-SqliteCode AnalyticsRecords::write(TransactionAllowance& allowance) {
-  while (hasTaken() && !allowance.isUsedUp()) {
-    const SqliteCode code = writeNext(allowance);
-    if (code != SQLITE_OK) return code;
-  }
-  return spans_.flush();
+  spans().release();
 }
 
 // Builds the payload of a taken event. Frees the builder with the message that it holds, so that
@@ -105,19 +93,10 @@ SqliteCode AnalyticsRecords::writeNext(TransactionAllowance& allowance) {
   // The payload that was built ahead is kept for the next record unless this one has used it.
   if (twin != nullptr) hasLookedAhead_ = false;
   const std::uint64_t events = twin != nullptr ? 2 : 1;
-  const std::string_view text = encoder_.encode(payload);
+  const std::string_view text = encoder().encode(payload);
 
   next_ += events;
-  written_ += events;
-  writtenBytes_ += text.size();
-  allowance.records -= static_cast<std::int64_t>(events);
-  allowance.payloadBytes -= static_cast<std::int64_t>(text.size());
-  // The record is counted as written although it is not stored: the queue must know that it is
-  // gone.
-  if (text.size() > longestPayload_) {
-    tooLarge_ += events;
-    return SQLITE_OK;
-  }
+  if (!charge(allowance, events, text.size())) return SQLITE_OK;
   return insert(taken_[index], twin, text);
 }
 
@@ -126,7 +105,7 @@ SqliteCode AnalyticsRecords::insert(const Event& event, const Event* twin,
   SqliteCode code = identify(*event.name);
   if (code != SQLITE_OK) return code;
   Statement& statement = statements_.insertRecord;
-  statement.bind(1, spans_.next());
+  statement.bind(1, spans().next());
   statement.bind(2, event.time);
   statement.bind(3, event.name->databaseID);
   if (twin != nullptr) {
@@ -141,9 +120,9 @@ SqliteCode AnalyticsRecords::insert(const Event& event, const Event* twin,
   statement.bind(6, payload);
   code = statement.run();
   if (code != SQLITE_OK) return code;
-  code = spans_.note(event.time);
-  if (code == SQLITE_OK && twin != nullptr) code = spans_.note(twin->time);
-  spans_.advance();
+  code = spans().note(event.time);
+  if (code == SQLITE_OK && twin != nullptr) code = spans().note(twin->time);
+  spans().advance();
   return code;
 }
 
@@ -164,38 +143,19 @@ SqliteCode AnalyticsRecords::identify(EventName& name) {
   return code == SQLITE_ROW ? SQLITE_OK : code;
 }
 
-void AnalyticsRecords::onCommitted(FinishedRecords& finished) {
-  spans_.onCommitted();
-  counters_.addStored(written_ - tooLarge_);
-  endTransaction(finished);
-}
-
-void AnalyticsRecords::endTransaction(FinishedRecords& finished) {
-  if (tooLarge_ > 0) {
-    counters_.addDropped(DropReason::kTooLarge, tooLarge_);
-    if (tooLargeLines_.tryPass()) {
-      kLog.error("dropped an event whose payload is longer than ", longestPayload_, " bytes");
-    }
-  }
-  finished.written += written_;
-  finished.writtenBytes += writtenBytes_;
-  written_ = writtenBytes_ = tooLarge_ = 0;
-}
-
-std::uint64_t AnalyticsRecords::dropTaken(DropReason reason, FinishedRecords& finished) {
-  spans_.onRolledBack();
+std::uint64_t AnalyticsRecords::forgetTaken() {
   // The rollback has removed the rows of names that were new in this transaction.
   ++generation_;
   hasLookedAhead_ = false;
   lookedAhead_ = {};
   const std::uint64_t unwritten = taken_.size() - next_;
-  const std::uint64_t dropped = written_ - tooLarge_ + unwritten;
-  counters_.addDropped(reason, dropped);
-  endTransaction(finished);
-  finished.unwritten += unwritten;
   taken_.clear();
   next_ = 0;
-  return dropped;
+  return unwritten;
+}
+
+void AnalyticsRecords::logTooLarge(std::uint64_t longestPayload) const {
+  kLog.error("dropped an event whose payload is longer than ", longestPayload, " bytes");
 }
 
 }  // namespace halvox::platform::linux_

@@ -5,35 +5,20 @@
 #include <utility>
 #include <vector>
 
-#include "platform/linux/store/PayloadEncoder.h"
-#include "platform/linux/store/RecordCounters.h"
-#include "platform/linux/store/RecordKind.h"
-#include "platform/linux/store/RecordSpans.h"
 #include "platform/linux/store/RecordTables.h"
-#include "platform/linux/store/StoreLog.h"
-#include "platform/linux/store/WriterQueue.h"
+#include "platform/linux/store/SpannedRecordKind.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {
 
 // The part of SimpleRecords that does not depend on the type of the record. Threads, owner and
 // failures are those of RecordKind.
-class SimpleRecordKind : public RecordKind {
+class SimpleRecordKind : public SpannedRecordKind {
  public:
   [[nodiscard]] SqliteCode prepare(Database& database) final;
   void release() final;
   void takeQueued() final;
   [[nodiscard]] bool hasTaken() const final { return next_ < taken_; }
-  [[nodiscard]] SqliteCode write(TransactionAllowance& allowance) final;
-  void onCommitted(FinishedRecords& finished) final;
-  std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) final;
-  [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time) final {
-    return spans_.oldestTime(time);
-  }
-  [[nodiscard]] SqliteCode deleteOldest(bool& found) final { return spans_.deleteOldest(found); }
-  [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) final {
-    return spans_.deleteOlderThan(time, found);
-  }
 
  protected:
   // The parameter of the record's first own column in the INSERT: 1 is the ID, 2 the time.
@@ -49,16 +34,6 @@ class SimpleRecordKind : public RecordKind {
   SimpleRecordKind(const RecordTable& table, WriterQueue& queue, StatisticsService& statistics,
                    std::uint64_t longestPayload);
 
-  // Waits for room and runs `append`, which queues one record. Returns false when the store is
-  // closed; then the record is counted as dropped.
-  template <typename Append>
-  bool addQueued(Append&& append) {
-    counters_.addReceived();
-    const bool added = queue_.add(std::forward<Append>(append));
-    if (!added) counters_.addDropped(DropReason::kClosed, 1);
-    return added;
-  }
-
   // Moves the queued records to the taken ones and returns their number.
   virtual std::size_t takeRecords() = 0;
   // Binds the columns of a taken record to the statement. They stay valid until the next call.
@@ -67,24 +42,16 @@ class SimpleRecordKind : public RecordKind {
   virtual void forgetRecords() = 0;
 
  private:
-  [[nodiscard]] SqliteCode writeNext(TransactionAllowance& allowance);
-  void endTransaction(FinishedRecords& finished);
+  [[nodiscard]] SqliteCode writeNext(TransactionAllowance& allowance) final;
+  std::uint64_t forgetTaken() final;
+  void logTooLarge(std::uint64_t longestPayload) const final;
 
   const RecordTable& table_;
-  WriterQueue& queue_;
-  RecordCounters counters_;
-  const std::uint64_t longestPayload_;
 
   // Used by the writer's thread only.
-  PayloadEncoder encoder_;
-  RecordSpans spans_;
   Statement insert_;
   std::size_t taken_ = 0;
-  std::size_t next_ = 0;            // the first taken record that is not written yet
-  std::uint64_t written_ = 0;       // records in the open transaction, including tooLarge_
-  std::uint64_t writtenBytes_ = 0;  // the length of their payloads
-  std::uint64_t tooLarge_ = 0;      // records among written_ that were dropped for their length
-  OncePerSecond tooLargeLines_;
+  std::size_t next_ = 0;  // the first taken record that is not written yet
 };
 
 // One kind of record that is stored one to a row. `Record` has `table` (its RecordTable), `time`

@@ -1,0 +1,51 @@
+#include "platform/linux/store/SpannedRecordKind.h"
+
+namespace halvox::platform::linux_ {
+
+SqliteCode SpannedRecordKind::write(TransactionAllowance& allowance) {
+  while (hasTaken() && !allowance.isUsedUp()) {
+    const SqliteCode code = writeNext(allowance);
+    if (code != SQLITE_OK) return code;
+  }
+  return spans_.flush();
+}
+
+bool SpannedRecordKind::charge(TransactionAllowance& allowance, std::uint64_t records,
+                               std::size_t payloadBytes) {
+  written_ += records;
+  writtenBytes_ += payloadBytes;
+  allowance.records -= static_cast<std::int64_t>(records);
+  allowance.payloadBytes -= static_cast<std::int64_t>(payloadBytes);
+  if (payloadBytes <= longestPayload_) return true;
+  // Counted as written although it is not stored: the queue must know that it is gone.
+  tooLarge_ += records;
+  return false;
+}
+
+void SpannedRecordKind::onCommitted(FinishedRecords& finished) {
+  spans_.onCommitted();
+  counters_.addStored(written_ - tooLarge_);
+  endTransaction(finished);
+}
+
+void SpannedRecordKind::endTransaction(FinishedRecords& finished) {
+  if (tooLarge_ > 0) {
+    counters_.addDropped(DropReason::kTooLarge, tooLarge_);
+    if (tooLargeLines_.tryPass()) logTooLarge(longestPayload_);
+  }
+  finished.written += written_;
+  finished.writtenBytes += writtenBytes_;
+  written_ = writtenBytes_ = tooLarge_ = 0;
+}
+
+std::uint64_t SpannedRecordKind::dropTaken(DropReason reason, FinishedRecords& finished) {
+  spans_.onRolledBack();
+  const std::uint64_t unwritten = forgetTaken();
+  const std::uint64_t dropped = written_ - tooLarge_ + unwritten;
+  counters_.addDropped(reason, dropped);
+  endTransaction(finished);
+  finished.unwritten += unwritten;
+  return dropped;
+}
+
+}  // namespace halvox::platform::linux_

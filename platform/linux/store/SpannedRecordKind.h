@@ -1,0 +1,92 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <optional>
+#include <string_view>
+#include <utility>
+
+#include "platform/linux/store/PayloadEncoder.h"
+#include "platform/linux/store/RecordCounters.h"
+#include "platform/linux/store/RecordKind.h"
+#include "platform/linux/store/RecordSpans.h"
+#include "platform/linux/store/StoreLog.h"
+#include "platform/linux/store/WriterQueue.h"
+#include "platform/statistics.h"
+
+namespace halvox::platform::linux_ {
+
+// What all kinds of records have in common: their numbers and spans, the length that a payload may
+// have, and the account of the open transaction. Threads, owner and failures are those of
+// RecordKind.
+class SpannedRecordKind : public RecordKind {
+ public:
+  [[nodiscard]] SqliteCode write(TransactionAllowance& allowance) final;
+  void onCommitted(FinishedRecords& finished) final;
+  std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) final;
+  [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time) final {
+    return spans_.oldestTime(time);
+  }
+  [[nodiscard]] SqliteCode deleteOldest(bool& found) final { return spans_.deleteOldest(found); }
+  [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found) final {
+    return spans_.deleteOlderThan(time, found);
+  }
+
+ protected:
+  // The names are not copied: pass constants.
+  struct Names {
+    std::string_view records;  // the table of the records
+    std::string_view spans;    // the table of their spans
+    std::string_view piece;    // under which they are counted
+  };
+
+  // Does not own its arguments, which must outlive it. `longestPayload` is in bytes.
+  SpannedRecordKind(const Names& names, WriterQueue& queue, StatisticsService& statistics,
+                    std::uint64_t longestPayload)
+      : queue_(queue),
+        counters_(statistics, names.piece),
+        longestPayload_(longestPayload),
+        spans_(names.records, names.spans) {}
+
+  // Waits for room and runs `append`, which queues one record. Returns false when the store is
+  // closed; then the record is counted as dropped.
+  template <typename Append>
+  bool addQueued(Append&& append) {
+    // Before the wait for room, so that the counts show what waits.
+    counters_.addReceived();
+    const bool added = queue_.add(std::forward<Append>(append));
+    if (!added) counters_.addDropped(DropReason::kClosed, 1);
+    return added;
+  }
+
+  // Adds records that share one payload to the account of the open transaction. Returns false if
+  // the payload is too long; then they are counted as dropped and must not be written.
+  [[nodiscard]] bool charge(TransactionAllowance& allowance, std::uint64_t records,
+                            std::size_t payloadBytes);
+
+  [[nodiscard]] RecordSpans& spans() { return spans_; }
+  [[nodiscard]] PayloadEncoder& encoder() { return encoder_; }
+
+ private:
+  // Writes the next taken record, or the next two if they share one.
+  [[nodiscard]] virtual SqliteCode writeNext(TransactionAllowance& allowance) = 0;
+  // Frees all taken records, after a failed transaction. Returns how many were not written.
+  virtual std::uint64_t forgetTaken() = 0;
+  // Logs that a payload was longer than that many bytes.
+  virtual void logTooLarge(std::uint64_t longestPayload) const = 0;
+  void endTransaction(FinishedRecords& finished);
+
+  WriterQueue& queue_;
+  RecordCounters counters_;
+  const std::uint64_t longestPayload_;
+
+  // Used by the writer's thread only.
+  PayloadEncoder encoder_;
+  RecordSpans spans_;
+  std::uint64_t written_ = 0;       // records in the open transaction, including tooLarge_
+  std::uint64_t writtenBytes_ = 0;  // the length of their payloads
+  std::uint64_t tooLarge_ = 0;      // records among written_ that were dropped for their length
+  OncePerSecond tooLargeLines_;
+};
+
+}  // namespace halvox::platform::linux_
