@@ -66,6 +66,7 @@ class AbsentPreferences final : public PreferenceService {
   }
 };
 
+// Refuses every registration. The service logs that and runs without notifications.
 class AbsentNotify final : public NotifyService {
  public:
   NotifyStatus notify_register_dispatch(std::string_view, NotifyToken&,
@@ -104,6 +105,7 @@ class AbsentDiagnosticReporters final : public DiagnosticReporterService {
   void setStateSource(StateSource) override {}
 };
 
+// A file that cannot be committed: no disk is measured.
 class AbsentJsonArrayFile final : public JsonArrayFile {
  public:
   void appendObject(std::string_view, const Dictionary&) override {}
@@ -123,6 +125,7 @@ class AbsentTlmReportingSession final : public TLMReportingSession {
   std::string description() const override { return "none"; }
 };
 
+// Finds no back-end, at once and on the caller's thread, unlike a real link. Accepts no message.
 class AbsentTlmReporting final : public TLMReportingService {
  public:
   Token TLMHierarchyTokenCreate() override {
@@ -168,6 +171,7 @@ class AbsentIOReport final : public IOReportService {
   void IOReportIterate(const Samples&, const Visitor&) const override {}
 };
 
+// Nothing can be recorded. An end completes at once, so that no stop waits.
 class AbsentKtrace final : public KtraceService {
  public:
   Session ktrace_session_create() override { return std::make_shared<KtraceSession>(); }
@@ -210,6 +214,7 @@ class AbsentResultsFiles final : public ResultsFileService {
   void sswriter_close(Writer) override {}
 };
 
+// Fails to start at once, and never completes.
 class AbsentTraceSession final : public KQTraceSession {
  public:
   void setDelegate(std::weak_ptr<KQTraceSessionDelegate> delegate) override {

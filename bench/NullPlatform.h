@@ -51,11 +51,13 @@ class SteppingClock final : public platform::ClockService {
   mutable double looks_ = 0;
 };
 
+// The benchmarks make connections of their own; nothing may ask for a listener.
 class NullConnections final : public platform::ConnectionService {
  public:
   [[noreturn]] platform::NSXPCListener& serviceListener() override { std::abort(); }
 };
 
+// No property: the build is not internal.
 class NullDeviceProperties final : public platform::DevicePropertyService {
  public:
   std::optional<platform::Value> copyDeviceProperty(std::string_view /*key*/) const override {
@@ -82,6 +84,7 @@ class ListQueue final : public platform::DispatchQueue {
   std::deque<platform::Job>& jobs_;  // owned by the ListDispatch
 };
 
+// A wait would hang the only thread, so it ends the program.
 class NullSemaphore final : public platform::DispatchSemaphore {
  public:
   void signal() override {}
@@ -112,6 +115,7 @@ class ListDispatch final : public platform::DispatchService {
   std::deque<platform::Job> jobs_;
 };
 
+// No feature is enabled, and nothing is traced.
 class NullFeatureFlags final : public platform::FeatureFlagService {
  public:
   bool _os_feature_enabled_impl(std::string_view /*domain*/,
@@ -126,6 +130,7 @@ class NullKdebug final : public platform::KdebugService {
                     std::uint64_t /*third*/, std::uint64_t /*fourth*/) override {}
 };
 
+// Counts the bytes of the lines instead of writing them.
 class NullLogCategory final : public platform::LogCategory {
  public:
   explicit NullLogCategory(platform::LogLevel level) : LogCategory(level) {}
@@ -164,6 +169,7 @@ class NullProcess final : public platform::ProcessService {
   [[noreturn]] void terminate(int /*exitStatus*/) override { std::abort(); }
 };
 
+// Real counters, because counting is part of the cost of a message.
 class MapStatistics final : public platform::StatisticsService {
  public:
   platform::Counter& counter(std::string_view piece, std::string_view name) override {

@@ -6,7 +6,7 @@
 
 namespace halvox {
 
-// The label of the reporting queue.
+// The label of the reporting queue. Logs and counters show it.
 extern const char* const gReportingQueueName;
 
 // The serial queue of the process on which clients are registered and all requests are carried out.

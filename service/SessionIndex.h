@@ -51,6 +51,7 @@ class SessionIndex {
   using Holders = std::vector<Holder>;  // sorted by place
   using StartedSessions = std::map<ReporterID, Session>;
 
+  // These keep holders_ and started_ consistent; an ID without holders has no entry.
   void add(Place place, const Client& client, const Session& session);
   void remove(Place place, const Session& session);
   void removeStarted(Place place, const Session& session);

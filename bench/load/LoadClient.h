@@ -42,7 +42,9 @@ class LoadClient {
   void createSessions(std::int64_t first, std::int64_t count);
 
  private:
+  // Sends a request with one number and waits for the answer. Throws if that is an error.
   void call(const char* member, std::int64_t argument);
+  // Sends a message without waiting; its answer is counted in answered_.
   void sendOne(std::int64_t number, const MessageShape& shape);
 
   sd_bus* bus_ = nullptr;

@@ -18,6 +18,7 @@ struct Measurement {
 
   // value / echo, or the value itself.
   [[nodiscard]] double compared() const;
+  // True if the bounds are met; also true without bounds.
   [[nodiscard]] bool holds() const;
 };
 

@@ -14,6 +14,8 @@ namespace halvox::bench {
 // event.
 enum class ServerKind : std::uint8_t { kEcho, kStored, kUnwanted };
 
+// The aims of the measurements apply to a service without a link; the default link stores a third
+// record for each message.
 inline constexpr const char* kNoLink = "[link]\nbackend = \"none\"\n";
 inline constexpr const char* kLocalLink = "[link]\nbackend = \"local\"\n";
 

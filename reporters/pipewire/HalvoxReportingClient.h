@@ -11,6 +11,7 @@ class HalvoxReportingClient final : public ReportingClient {
  public:
   explicit HalvoxReportingClient(client::HalvoxClient& client) : client_(client) {}
 
+  // After a lost connection the library creates and starts the sessions again by itself.
   void createSession(ReporterID id) override { client_.createSession(id); }
   void setServiceType(ReporterID id, ServiceType type) override {
     client_.setServiceType(id, type);

@@ -25,6 +25,7 @@ struct Route {
   friend bool operator==(const Route&, const Route&) = default;
 };
 
+// A connection from a port of the node `output` to a port of the node `input`.
 struct Link {
   GlobalID output = 0;
   GlobalID input = 0;

@@ -13,6 +13,7 @@ namespace halvox::pipewire_reporter {
 // The properties of a PipeWire object as they were received: any text under any key.
 using Properties = std::map<std::string, std::string, std::less<>>;
 
+// Whether a stream plays or records.
 enum class Direction : std::uint8_t { kPlayback, kRecord };
 
 // Returns the text under a key; empty when there is none.
