@@ -126,13 +126,19 @@ TEST_F(HalvoxClientReconnectTest, TellsItsHandlerOfEveryConnectionMadeAndLost) {
 
 TEST_F(HalvoxClientReconnectTest, DestructionDoesNotWaitForAServiceThatIsNotThere) {
   service_.vanish();
-  const auto before = std::chrono::steady_clock::now();
-  {
-    HalvoxClient client(options());
-    client.send(7, {{"n", 1}}, kPlayback, kStart);
+  // With a service that stalls, each destruction waits for a second. A busy machine may delay one
+  // of them as long, but hardly ten in a row.
+  std::chrono::steady_clock::duration fastest = 1h;
+  for (int attempt = 0; attempt < 10 && fastest >= 900ms; ++attempt) {
+    const auto before = std::chrono::steady_clock::now();
+    {
+      HalvoxClient client(options());
+      client.send(7, {{"n", 1}}, kPlayback, kStart);
+    }
+    fastest = std::min(fastest, std::chrono::steady_clock::now() - before);
   }
 
-  EXPECT_LT(std::chrono::steady_clock::now() - before, 900ms);
+  EXPECT_LT(fastest, 900ms);
 }
 
 TEST_F(HalvoxClientReconnectTest, GivesUpWhatWaitsWhenSessionStepsPileUpWithoutAService) {
