@@ -21,6 +21,10 @@ namespace halvox::platform::linux_ {
 class HALVOX_THREAD_ANNOTATION(capability("mutex")) Mutex {
  public:
   void lock() HALVOX_THREAD_ANNOTATION(acquire_capability()) { mutex_.lock(); }
+  // Returns false at once if the mutex is held already.
+  [[nodiscard]] bool tryLock() HALVOX_THREAD_ANNOTATION(try_acquire_capability(true)) {
+    return mutex_.try_lock();
+  }
   void unlock() HALVOX_THREAD_ANNOTATION(release_capability()) { mutex_.unlock(); }
 
  private:
