@@ -2,9 +2,12 @@
 
 #include <algorithm>
 #include <array>
+#include <span>
 #include <utility>
 
+#include <poll.h>
 #include <sys/eventfd.h>
+#include <unistd.h>
 
 #include "platform/linux/base/ThreadSetup.h"
 
@@ -17,6 +20,17 @@ constexpr std::size_t kMaxWaitingOperations = 8192;
 constexpr std::chrono::seconds kFarewell{1};
 // How often to look for work if there is no descriptor through which producers can wake the thread.
 constexpr std::chrono::milliseconds kPauseWithoutWakeUp{50};
+// While messages come, the worker naps instead of sleeping. A nap lasts an eighth of the time since
+// the last message, within these bounds. The shortest gathers messages; the longest costs a running
+// session a hundred wake-ups a second, about as many as its audio has.
+constexpr std::chrono::milliseconds kShortestNap{1};
+constexpr std::chrono::milliseconds kLongestNap{10};
+constexpr int kNapShare = 8;
+// How long after a message the worker naps although no session runs.
+constexpr std::chrono::seconds kNapsAfterMessage{1};
+// How long a flush does the worker's work itself. The service answers a request within microseconds
+// unless it is busy, and then a change of threads does not matter.
+constexpr std::chrono::milliseconds kLongestHelp{2};
 // Stands for "wait for ever": larger durations could overflow the clock's time points.
 constexpr std::chrono::hours kLongestWait{24 * 365};
 
@@ -31,12 +45,26 @@ Options withDefaults(Options options) {
   return options;
 }
 
+// Waits for events on the descriptors until the deadline at most.
+void pollUntil(std::span<pollfd> polled, std::chrono::steady_clock::time_point deadline) {
+  timespec remaining{};
+  const bool forEver = deadline == std::chrono::steady_clock::time_point::max();
+  if (!forEver) {
+    const auto left = std::max(deadline - std::chrono::steady_clock::now(),
+                               std::chrono::steady_clock::duration::zero());
+    const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(left);
+    remaining = {.tv_sec = seconds.count(), .tv_nsec = (left - seconds).count()};
+  }
+  ppoll(polled.data(), polled.size(), forEver ? nullptr : &remaining, nullptr);
+}
+
 }  // namespace
 
 ClientWorker::ClientWorker(Options options)
     : options_(withDefaults(std::move(options))),
       places_(socketPlaces(options_.socketPath)),
       ring_(options_.maxPendingMessages, options_.maxPendingBytes),
+      process_(getpid()),
       wakeUp_(eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)),
       watch_(places_),
       pause_(options_.reconnectMin) {
@@ -46,6 +74,11 @@ ClientWorker::ClientWorker(Options options)
 }
 
 ClientWorker::~ClientWorker() {
+  if (!isOwnProcess()) {
+    // After a fork() the thread is only in the parent, and so is the right to use the connection.
+    thread_.detach();
+    return;
+  }
   closing_.store(true, std::memory_order_relaxed);
   bool waiting = counters().pending > 0;
   {
@@ -60,13 +93,20 @@ ClientWorker::~ClientWorker() {
   wake();
 }
 
-bool ClientWorker::send(OutgoingMessage&& message) {
+bool ClientWorker::send(const MessageView& message) {
   // Relaxed is enough: a program that sends while it destroys its client has a race of its own.
-  if (closing_.load(std::memory_order_relaxed) || !ring_.tryPush(std::move(message))) {
-    dropped_.fetch_add(1, std::memory_order_relaxed);
-    return false;
+  const bool isClosing = closing_.load(std::memory_order_relaxed);
+  switch (isClosing ? EncodeOutcome::kNoRoom : ring_.tryPush(message)) {
+    case EncodeOutcome::kNoRoom:
+      dropped_.fetch_add(1, std::memory_order_relaxed);
+      return false;
+    case EncodeOutcome::kNoWireForm:
+      withoutForm_.fetch_add(1, std::memory_order_relaxed);
+      return true;
+    case EncodeOutcome::kDone:
+      break;
   }
-  // Wake the thread only if it sleeps for lack of work. That saves a system call for each message.
+  // Wake the thread only if it sleeps for lack of work. While it naps it comes by itself.
   if (asleep_.load(std::memory_order_seq_cst) && asleep_.exchange(false)) wake();
   return true;
 }
@@ -89,21 +129,54 @@ bool ClientWorker::flush(std::chrono::milliseconds timeout) {
   if (std::this_thread::get_id() == thread_.get_id()) return false;
   const TimePoint deadline =
       std::chrono::steady_clock::now() + std::min<std::chrono::milliseconds>(timeout, kLongestWait);
-  const MutexLock lock(mutex_);
-  const std::uint64_t position = ring_.tail();
-  // Flushes with nothing between them share a ticket. Otherwise they could fill the lane.
-  const bool shares = !lane_.empty() && lane_.back().position == position &&
-                      std::holds_alternative<FlushTicket>(lane_.back().step);
-  if (!shares) {
-    lane_.push_back({position, ++flushAsked_});
-    lanePosition_.store(lane_.front().position, std::memory_order_release);
+  if (!isOwnProcess()) return false;
+  FlushTicket ticket = 0;
+  {
+    const MutexLock lock(mutex_);
+    const std::uint64_t position = ring_.tail();
+    // Flushes with nothing between them share a ticket. Otherwise they could fill the lane.
+    const bool shares = !lane_.empty() && lane_.back().position == position &&
+                        std::holds_alternative<FlushTicket>(lane_.back().step);
+    if (!shares) {
+      lane_.push_back({position, ++flushAsked_});
+      lanePosition_.store(lane_.front().position, std::memory_order_release);
+    }
+    ticket = flushAsked_;
   }
-  const FlushTicket ticket = flushAsked_;
+  if (turn_.tryLock()) {
+    help(ticket, deadline);
+    const bool leavesNothing = unanswered_ == 0 && !stream_.hasOutput() && !ring_.isReady();
+    turn_.unlock();
+    if (leavesNothing && isFlushDone(ticket)) return true;
+  }
   wake();
+  const MutexLock lock(mutex_);
   while (flushDone_ < ticket && !endNow_) {
     if (!flushed_.waitUntil(mutex_, deadline)) break;
   }
   return flushDone_ >= ticket;
+}
+
+bool ClientWorker::isFlushDone(FlushTicket ticket) {
+  const MutexLock lock(mutex_);
+  return flushDone_ >= ticket;
+}
+
+void ClientWorker::help(FlushTicket ticket, TimePoint deadline) {
+  if (state_ != State::kReady) return;
+  const TimePoint end = std::min(deadline, std::chrono::steady_clock::now() + kLongestHelp);
+  for (;;) {
+    sendAll();
+    if (!stream_.isOpen() || isFlushDone(ticket)) return;
+    if (std::chrono::steady_clock::now() >= end) return;
+    const int events = stream_.hasOutput() ? POLLIN | POLLOUT : POLLIN;
+    std::array<pollfd, 2> polled{
+        {{stream_.fd(), static_cast<short>(events), 0}, {wakeUp_.get(), POLLIN, 0}}};
+    pollUntil(polled, end);
+    // The worker is wanted for something else, and waits for its turn.
+    if (polled[1].revents != 0) return;
+    if (polled[0].revents != 0 && !receive()) return;
+  }
 }
 
 void ClientWorker::setConnectionHandler(std::function<void(bool)> handler) {
@@ -124,11 +197,12 @@ Counters ClientWorker::counters() const {
   Counters counters;
   counters.dropped = dropped_.load(std::memory_order_relaxed);
   counters.acknowledged = acknowledged_.load(std::memory_order_acquire);
-  counters.refused = refused_.load(std::memory_order_acquire);
+  const std::uint64_t withoutForm = withoutForm_.load(std::memory_order_relaxed);
+  counters.refused = refused_.load(std::memory_order_acquire) + withoutForm;
   counters.lost = lost_.load(std::memory_order_acquire);
   counters.reconnects = reconnects_.load(std::memory_order_relaxed);
   // Read last. Otherwise more messages could seem settled than accepted.
-  counters.accepted = ring_.tail();
+  counters.accepted = ring_.tail() + withoutForm;
   counters.pending = counters.accepted - counters.acknowledged - counters.refused - counters.lost;
   return counters;
 }
@@ -139,18 +213,21 @@ void ClientWorker::wake() const {
   static_cast<void>(!write(wakeUp_.get(), &one, sizeof one));
 }
 
+bool ClientWorker::isOwnProcess() const { return getpid() == process_; }
+
 void ClientWorker::run() {
   platform::linux_::setUpThread("halvox-client");
+  turn_.lock();
   while (!isEnding()) {
     giveUpWaitingIfOverflowed();
     notifyNewHandler();
     if (state_ == State::kAbsent && std::chrono::steady_clock::now() >= retryAt_) tryConnect();
-    processBus();
-    while (isWindowOpen() && sendNext()) {
-    }
+    processStream();
+    sendAll();
     if (mayFallAsleep()) sleepUntilSomethingHappens();
   }
-  bus_.reset();
+  stream_ = {};
+  turn_.unlock();
 }
 
 bool ClientWorker::isEnding() {
@@ -159,45 +236,50 @@ bool ClientWorker::isEnding() {
 }
 
 bool ClientWorker::mayFallAsleep() {
+  nap_ = {};
   if (!isWindowOpen()) return true;  // the socket or the clock wakes, not a producer
-  asleep_.store(true, std::memory_order_seq_cst);
+  nap_ = napLength();
+  // Announce a sleep before the last look: a producer sees the one, or this thread its message.
+  if (nap_.count() == 0) asleep_.store(true, std::memory_order_seq_cst);
   const bool hasWork =
       ring_.isReady() || lanePosition_.load(std::memory_order_acquire) <= ring_.head();
   if (hasWork) asleep_.store(false, std::memory_order_seq_cst);
   return !hasWork;
 }
 
+std::chrono::milliseconds ClientWorker::napLength() const {
+  const auto quiet = std::chrono::steady_clock::now() - lastMessage_;
+  if (made_.running() == 0 && quiet >= kNapsAfterMessage) return {};
+  const auto share = std::chrono::duration_cast<std::chrono::milliseconds>(quiet / kNapShare);
+  return std::clamp(share, kShortestNap, kLongestNap);
+}
+
 ClientWorker::TimePoint ClientWorker::nextDeadline() const {
   TimePoint deadline = TimePoint::max();
   if (state_ == State::kAbsent) deadline = retryAt_;
   if (state_ == State::kConnecting) deadline = handshakeEnds_;
-  std::uint64_t busDeadline = UINT64_MAX;  // microseconds of the same clock
-  if (bus_ && sd_bus_get_timeout(bus_.get(), &busDeadline) >= 0 && busDeadline != UINT64_MAX) {
-    deadline = std::min(deadline, TimePoint(std::chrono::microseconds(busDeadline)));
-  }
-  if (!wakeUp_) {
-    deadline = std::min(deadline, std::chrono::steady_clock::now() + kPauseWithoutWakeUp);
-  }
+  const TimePoint now = std::chrono::steady_clock::now();
+  if (nap_.count() > 0) deadline = std::min(deadline, now + nap_);
+  if (!wakeUp_) deadline = std::min(deadline, now + kPauseWithoutWakeUp);
   return deadline;
 }
 
 void ClientWorker::sleepUntilSomethingHappens() {
   // poll() ignores negative descriptors.
   std::array<pollfd, 3> polled{{{wakeUp_.get(), POLLIN, 0}, {watch_.fd(), POLLIN, 0}, {-1, 0, 0}}};
-  if (bus_) {
-    const int events = sd_bus_get_events(bus_.get());
-    polled[2] = {sd_bus_get_fd(bus_.get()), static_cast<short>(std::max(events, 0)), 0};
+  if (stream_.isOpen()) {
+    // Without an open call only the end of the connection matters, which poll() reports anyway. The
+    // answer to a flush that helps then wakes the thread of the flush alone.
+    const bool expects = state_ == State::kConnecting || unanswered_ > 0;
+    const int events = (expects ? POLLIN : 0) | (stream_.hasOutput() ? POLLOUT : 0);
+    polled[2] = {stream_.fd(), static_cast<short>(events), 0};
   }
   const TimePoint deadline = nextDeadline();
-  timespec remaining{};
-  if (deadline != TimePoint::max()) {
-    const auto left = std::max(deadline - std::chrono::steady_clock::now(),
-                               std::chrono::steady_clock::duration::zero());
-    const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(left);
-    remaining = {.tv_sec = seconds.count(), .tv_nsec = (left - seconds).count()};
-  }
-  ppoll(polled.data(), polled.size(), deadline == TimePoint::max() ? nullptr : &remaining, nullptr);
+  turn_.unlock();
+  pollUntil(polled, deadline);
+  turn_.lock();
   asleep_.store(false, std::memory_order_seq_cst);
+  readable_ = (polled[2].revents & ~POLLOUT) != 0;
   if ((polled[0].revents & POLLIN) != 0) {
     std::uint64_t count = 0;
     static_cast<void>(!read(wakeUp_.get(), &count, sizeof count));
@@ -221,9 +303,10 @@ void ClientWorker::giveUpWaitingIfOverflowed() {
     end = ring_.tail();
   }
   while (ring_.head() < end && ring_.isReady()) {
-    ring_.pop();
+    ring_.take(nullptr);
     lost_.fetch_add(1, std::memory_order_release);
   }
+  ring_.release();
   // The lost operations may have changed any session. Connecting again makes the sessions as they
   // are wanted now.
   if (state_ != State::kAbsent) loseConnection();

@@ -5,18 +5,19 @@
 #include <cstdint>
 #include <deque>
 #include <functional>
-#include <list>
 #include <memory>
 #include <optional>
 #include <string>
 #include <thread>
+#include <variant>
 #include <vector>
 
-#include <poll.h>
+#include <sys/types.h>
 
+#include "client/FrameRing.h"
 #include "client/HalvoxClient.h"
-#include "client/MessageRing.h"
-#include "client/PeerBus.h"
+#include "client/RequestEncoder.h"
+#include "client/ServiceStream.h"
 #include "client/SessionTable.h"
 #include "client/SocketWatch.h"
 #include "platform/linux/base/Mutex.h"
@@ -26,13 +27,13 @@ namespace halvox::client {
 
 // The thread of a HalvoxClient, and the two lanes that lead to it.
 //
-//   send() ──► MessageRing ─────────┐
+//   send() ──encodes──► FrameRing ──┐
 //                                   ├─► window of open calls ──► socket
 //   session operations ──► lane ────┘
 //
-// Messages go through the ring. Session operations and flushes are rare. They go through a lane
-// with a lock, and each notes how many messages the ring had accepted before it. The worker can
-// therefore carry out everything in the order of the calls.
+// Messages go through the ring, as frames. Session operations and flushes are rare. They go through
+// a lane with a lock, and each notes how many messages the ring had accepted before it. The worker
+// can therefore carry out everything in the order of the calls.
 //
 //   absent ──socket connects──► connecting ──handshake──► ready
 //     ▲                            │                        │
@@ -42,6 +43,15 @@ namespace halvox::client {
 // and always reads answers, so that client and service cannot both wait for the other to read. If
 // the service does not answer, the worker takes nothing from the lanes, and they fill up to their
 // bounds.
+//
+// How the worker learns of a message. While it has a running session, and for a second after a
+// message, it looks into the ring again and again, after naps of 1 to 10 milliseconds: send() must
+// not make a system call on an audio thread, and a nap gathers messages for one write. Otherwise it
+// sleeps, and the next send() wakes it by one system call, so that an idle program has no wake-ups.
+//
+// A flush that finds the worker asleep does its work on its own thread, for two milliseconds at
+// most: two changes of threads cost more than the request. `turn_` says whose turn it is. What can
+// end the connection, and the connection handler, are left to the worker's thread.
 //
 // If the lane overflows (kMaxWaitingOperations) while there is no service, the worker discards it
 // with the waiting messages, which count as lost. It then makes the sessions in their latest state.
@@ -54,7 +64,7 @@ class ClientWorker {
   ClientWorker& operator=(const ClientWorker&) = delete;
 
   // Any thread may call these; see HalvoxClient.
-  bool send(OutgoingMessage&& message);
+  bool send(const MessageView& message);
   void post(SessionOperation operation);
   bool flush(std::chrono::milliseconds timeout);
   void setConnectionHandler(std::function<void(bool)> handler);
@@ -68,36 +78,39 @@ class ClientWorker {
   using FlushTicket = std::uint64_t;
   using ConnectionHandler = std::function<void(bool)>;
   enum class State : std::uint8_t { kAbsent, kConnecting, kReady };
-  enum class CallOutcome : std::uint8_t { kSent, kNoWireForm, kDisconnected };
-
   // A session operation or a flush, and the number of messages before it.
   struct LaneEntry {
     std::uint64_t position = 0;
     std::variant<SessionOperation, FlushTicket> step;
   };
-  // A call that the service has not answered. The call of a flush stays here until all calls before
-  // it are answered.
+  // A call that the service has not answered, or one after such a call. The call of a flush stays
+  // here until all calls before it are answered.
   struct OpenCall {
-    ClientWorker* worker = nullptr;
-    std::list<OpenCall>::iterator self{};
-    std::size_t bytes = 0;
-    bool isMessage = false;
-    FlushTicket flush = 0;  // 0: none
+    enum class Kind : std::uint8_t { kOperation, kMessage, kFlush };
+    Kind kind = Kind::kOperation;
     bool isAnswered = false;
+    std::uint32_t bytes = 0;
+    FlushTicket flush = 0;
   };
 
   // The loop, and its sleep.
   void run();
   [[nodiscard]] bool isEnding();
   void wake() const;
+  [[nodiscard]] bool isOwnProcess() const;
   [[nodiscard]] bool mayFallAsleep();
-  void sleepUntilSomethingHappens();
+  [[nodiscard]] std::chrono::milliseconds napLength() const;
+  void sleepUntilSomethingHappens() HALVOX_REQUIRES(turn_);
   [[nodiscard]] TimePoint nextDeadline() const;
+  // On the thread of a flush.
+  void help(FlushTicket ticket, TimePoint deadline);
+  [[nodiscard]] bool isFlushDone(FlushTicket ticket);
 
   // The connection.
   void tryConnect();
   [[nodiscard]] std::vector<std::string> placesToTry() const;
-  void processBus();
+  void processStream();
+  bool receive();
   void onReady();
   void loseConnection();
   void pauseBeforeRetry();
@@ -106,28 +119,33 @@ class ClientWorker {
   void notifyNewHandler();
 
   // What goes out.
-  [[nodiscard]] bool isWindowOpen() const;
+  [[nodiscard]] bool isWindowOpen() const { return state_ == State::kReady && windowIsOpen_; }
+  void updateWindow();
+  void sendAll();
   bool sendNext();
   void sendFromLane();
   void sendOperation(const SessionOperation& operation);
   void sendFlush(FlushTicket ticket);
   void sendMessageAtHead();
-  CallOutcome call(Request&& request, const OpenCall& description);
+  void numberCall(char* frame, const OpenCall& call);
+  void numberWithoutAnswer(char* frame);
   void giveUpWaitingIfOverflowed();
 
   // What comes back.
-  static int onReply(sd_bus_message* answer, void* userData, sd_bus_error* error);
-  void onAnswer(OpenCall& call, bool isError);
+  bool takeAnswers();
+  void onAnswer(const Answer& answer);
   void finishFlushes();
 
   const Options options_;
   const std::vector<std::string> places_;  // where the service may be, in the order of trying
-  MessageRing ring_;
+  FrameRing ring_;
+  const pid_t process_;
   platform::linux_::UniqueFd wakeUp_;
   std::atomic<bool> asleep_{false};  // sequentially consistent with the slots of the ring
   std::atomic<bool> closing_{false};
   std::atomic<bool> connected_{false};
   std::atomic<std::uint64_t> dropped_{0};
+  std::atomic<std::uint64_t> withoutForm_{0};  // accepted and refused without a place in the ring
   // Written only by the worker. counters() reads them before the ring's tail(), so that their sum
   // is never larger than the accepted messages.
   std::atomic<std::uint64_t> acknowledged_{0};
@@ -150,7 +168,10 @@ class ClientWorker {
   bool endNow_ HALVOX_GUARDED_BY(mutex_) = false;
   std::string shownPlace_ HALVOX_GUARDED_BY(mutex_);  // of the present or last connection
 
-  // The worker's own.
+  // Held by the thread that does the worker's work: nearly always the worker itself, except in its
+  // sleep. Taken before `mutex_`.
+  platform::linux_::Mutex turn_;
+  // The following belong to whose turn it is.
   SocketWatch watch_;
   State state_ = State::kAbsent;
   TimePoint retryAt_{};
@@ -162,9 +183,16 @@ class ClientWorker {
   SessionTable made_;                      // after all operations that were sent
   std::deque<SessionOperation> remaking_;  // before anything else of the lanes
   std::deque<FlushTicket> interruptedFlushes_;
-  std::list<OpenCall> open_;  // oldest first; starts, which are answered at the stop, are not here
+  TimePoint lastMessage_{};           // when the last one was taken out of the ring
+  std::chrono::milliseconds nap_{0};  // of the coming sleep; 0: none
+  bool readable_ = false;             // the socket may have bytes to read, or have been closed
+  bool windowIsOpen_ = true;
+  std::uint32_t lastSerial_ = 0;
+  // Calls with consecutive serials up to `lastSerial_`, but without the frames that get no answer.
+  std::deque<OpenCall> open_;
+  std::size_t unanswered_ = 0;
   std::size_t openBytes_ = 0;
-  Bus bus_;
+  ServiceStream stream_;
   std::jthread thread_;
 };
 

@@ -13,6 +13,14 @@ using platform::linux_::MutexLock;
 constexpr std::size_t kMaxOpenCalls = 256;
 // The same in bytes. A single larger message is allowed.
 constexpr std::size_t kMaxOpenBytes = std::size_t{4} << 20U;
+// A full window opens again when half of it is answered: fewer and larger writes.
+constexpr std::size_t kReopenAtCalls = kMaxOpenCalls / 2;
+constexpr std::size_t kReopenAtBytes = kMaxOpenBytes / 2;
+// Calls that are tracked for the sake of an older one without an answer. A service that leaves a
+// call unanswered for so long does not work.
+constexpr std::size_t kMostTrackedCalls = std::size_t{1} << 16U;
+// How many messages are sent before their room is given back to the producers.
+constexpr int kReleaseAfter = 64;
 
 }  // namespace
 
@@ -20,8 +28,8 @@ void ClientWorker::tryConnect() {
   // Watch before the attempt: a service that appears after it is then noticed.
   watch_.begin();
   auto connected = connectToService(placesToTry());
-  if (auto* made = std::get_if<ConnectedBus>(&connected)) {
-    bus_ = std::move(made->bus);
+  if (auto* made = std::get_if<ConnectedStream>(&connected)) {
+    stream_ = std::move(made->stream);
     place_ = std::move(made->place);
     state_ = State::kConnecting;
     handshakeEnds_ = std::chrono::steady_clock::now() + options_.requestTimeout;
@@ -40,22 +48,22 @@ std::vector<std::string> ClientWorker::placesToTry() const {
   return places_;
 }
 
-void ClientWorker::processBus() {
-  if (!bus_) return;
-  int result = 0;
-  do {
-    result = sd_bus_process(bus_.get(), nullptr);
-  } while (result > 0 && sd_bus_is_open(bus_.get()) > 0);
-  if (result < 0 || sd_bus_is_open(bus_.get()) <= 0) {
+void ClientWorker::processStream() {
+  if (state_ == State::kAbsent) return;
+  const bool alive =
+      stream_.isOpen() && stream_.send() && (!std::exchange(readable_, false) || receive());
+  if (!alive || open_.size() > kMostTrackedCalls) {
     loseConnection();
   } else if (state_ == State::kConnecting) {
-    if (sd_bus_is_ready(bus_.get()) > 0) {
+    if (stream_.isReady()) {
       onReady();
     } else if (std::chrono::steady_clock::now() >= handshakeEnds_) {
       loseConnection();
     }
   }
 }
+
+bool ClientWorker::receive() { return stream_.receive() && (!stream_.isReady() || takeAnswers()); }
 
 void ClientWorker::onReady() {
   state_ = State::kReady;
@@ -74,13 +82,17 @@ void ClientWorker::onReady() {
 void ClientWorker::loseConnection() {
   std::deque<FlushTicket> flushes;
   for (const auto& call : open_) {
-    if (call.isMessage) lost_.fetch_add(1, std::memory_order_release);
-    if (call.flush != 0) flushes.push_back(call.flush);
+    if (call.kind == OpenCall::Kind::kMessage && !call.isAnswered) {
+      lost_.fetch_add(1, std::memory_order_release);
+    }
+    if (call.kind == OpenCall::Kind::kFlush) flushes.push_back(call.flush);
   }
   interruptedFlushes_.insert(interruptedFlushes_.begin(), flushes.begin(), flushes.end());
-  bus_.reset();  // its replies point at the calls, so it goes first
+  stream_ = {};
   open_.clear();
+  unanswered_ = 0;
   openBytes_ = 0;
+  windowIsOpen_ = true;
   remaking_.clear();
   const bool wasReady = state_ == State::kReady;
   if (wasReady) samePlaceUntil_ = std::chrono::steady_clock::now() + options_.samePlaceFor;
@@ -121,8 +133,20 @@ void ClientWorker::notifyNewHandler() {
   if (state_ == State::kReady) notifyConnection(true);
 }
 
-bool ClientWorker::isWindowOpen() const {
-  return state_ == State::kReady && open_.size() < kMaxOpenCalls && openBytes_ < kMaxOpenBytes;
+void ClientWorker::updateWindow() {
+  if (unanswered_ >= kMaxOpenCalls || openBytes_ >= kMaxOpenBytes) windowIsOpen_ = false;
+  if (unanswered_ <= kReopenAtCalls && openBytes_ <= kReopenAtBytes) windowIsOpen_ = true;
+}
+
+void ClientWorker::sendAll() {
+  const std::uint64_t before = ring_.head();
+  for (int count = 1; isWindowOpen() && sendNext(); ++count) {
+    if (count % kReleaseAfter == 0) ring_.release();
+  }
+  ring_.release();
+  if (ring_.head() != before) lastMessage_ = std::chrono::steady_clock::now();
+  // A failure shows when the worker next looks at the connection.
+  if (stream_.isOpen()) stream_.send();
 }
 
 bool ClientWorker::sendNext() {
@@ -172,88 +196,94 @@ void ClientWorker::sendFromLane() {
 }
 
 void ClientWorker::sendOperation(const SessionOperation& operation) {
-  Request request = makeRequest(bus_.get(), operation);
-  if (!std::holds_alternative<StartSession>(operation.step)) {
-    // Only a configuration that the wire cannot hold fails here. Trying again would not help.
-    if (call(std::move(request), {}) == CallOutcome::kDisconnected) loseConnection();
-    return;
+  Request request = makeRequest(operation);
+  // Only a configuration that the wire cannot hold fails here. Trying again would not help.
+  auto* frame = std::get_if<std::string>(&request);
+  if (frame == nullptr) return;
+  if (std::holds_alternative<StartSession>(operation.step)) {
+    // The service answers a start at the stop. The client does not wait for that, so it asks for no
+    // answer.
+    numberWithoutAnswer(frame->data());
+  } else {
+    numberCall(frame->data(), {});
   }
-  // The service answers a start at the stop. The client does not wait for that, so it asks for no
-  // answer.
-  const auto* message = std::get_if<BusMessage>(&request);
-  if (message == nullptr || sd_bus_send(bus_.get(), message->get(), nullptr) < 0) loseConnection();
+  stream_.append(*frame);
 }
 
 void ClientWorker::sendFlush(FlushTicket ticket) {
   // Send a query that changes nothing. Its answer comes after all earlier answers.
-  if (call(makeRequest(bus_.get(), "reporterIDValid", 0), {.flush = ticket}) ==
-      CallOutcome::kSent) {
-    return;
-  }
-  interruptedFlushes_.push_front(ticket);
-  loseConnection();
+  Request request = makeRequest("reporterIDValid", 0);
+  auto& frame = std::get<std::string>(request);
+  numberCall(frame.data(), {.kind = OpenCall::Kind::kFlush, .flush = ticket});
+  stream_.append(frame);
 }
 
 void ClientWorker::sendMessageAtHead() {
-  const OutgoingMessage& message = ring_.front();
-  const CallOutcome outcome =
-      call(makeSendMessage(bus_.get(), message), {.bytes = message.weight(), .isMessage = true});
-  switch (outcome) {
-    case CallOutcome::kSent:
-      ring_.pop();
-      break;
-    case CallOutcome::kNoWireForm:
-      ring_.pop();
-      refused_.fetch_add(1, std::memory_order_release);
-      break;
-    case CallOutcome::kDisconnected:
-      loseConnection();  // the message stays where it is, for the next connection
-      break;
-  }
+  const std::size_t bytes = ring_.frontBytes();
+  char* frame = stream_.append(bytes);
+  ring_.take(frame);
+  numberCall(frame, {.kind = OpenCall::Kind::kMessage, .bytes = static_cast<std::uint32_t>(bytes)});
 }
 
-ClientWorker::CallOutcome ClientWorker::call(Request&& request, const OpenCall& description) {
-  auto* message = std::get_if<BusMessage>(&request);
-  if (message == nullptr) return CallOutcome::kNoWireForm;
-  OpenCall& opened = open_.emplace_back(description);
-  opened.worker = this;
-  opened.self = std::prev(open_.end());
-  const int result =
-      sd_bus_call_async(bus_.get(), nullptr, message->get(), onReply, &opened, kNoTimeout);
-  if (result >= 0) {
-    openBytes_ += opened.bytes;
-    return CallOutcome::kSent;
-  }
-  open_.pop_back();
-  // The connection works, so the library refused the message, usually for its size.
-  return sd_bus_is_open(bus_.get()) > 0 ? CallOutcome::kNoWireForm : CallOutcome::kDisconnected;
+void ClientWorker::numberCall(char* frame, const OpenCall& call) {
+  // No call has the number 0. A call that is answered already keeps the numbers consecutive.
+  if (++lastSerial_ == 0 && !open_.empty()) open_.push_back({.isAnswered = true});
+  if (lastSerial_ == 0) ++lastSerial_;
+  setSerial(frame, lastSerial_);
+  open_.push_back(call);
+  ++unanswered_;
+  openBytes_ += call.bytes;
+  updateWindow();
 }
 
-int ClientWorker::onReply(sd_bus_message* answer, void* userData, sd_bus_error* /*error*/) {
-  auto& call = *static_cast<OpenCall*>(userData);
-  ClientWorker& worker = *call.worker;
-  // When the connection ends, the library itself answers open calls; loseConnection() counts them.
-  if (sd_bus_is_open(worker.bus_.get()) <= 0) return 0;
-  worker.onAnswer(call, sd_bus_message_is_method_error(answer, nullptr) > 0);
-  return 0;
-}
-
-void ClientWorker::onAnswer(OpenCall& call, bool isError) {
-  pause_ = options_.reconnectMin;  // the service is well
-  if (call.isMessage) (isError ? refused_ : acknowledged_).fetch_add(1, std::memory_order_release);
-  openBytes_ -= call.bytes;
-  if (call.flush != 0) {
-    call.isAnswered = true;
-  } else {
-    open_.erase(call.self);
-  }
+void ClientWorker::numberWithoutAnswer(char* frame) {
+  numberCall(frame, {});
+  setNoReplyExpected(frame);
+  --unanswered_;
+  open_.back().isAnswered = true;
+  updateWindow();
   finishFlushes();
+}
+
+bool ClientWorker::takeAnswers() {
+  for (;;) {
+    const NextFrame next = nextFrame(stream_.input());
+    switch (next.state) {
+      case NextFrame::State::kIncomplete:
+        finishFlushes();
+        return true;
+      case NextFrame::State::kBroken:
+        stream_.end();
+        return false;
+      case NextFrame::State::kAnswer:
+        onAnswer(next.answer);
+        break;
+      case NextFrame::State::kOther:
+        break;
+    }
+    stream_.consume(next.bytes);
+  }
+}
+
+void ClientWorker::onAnswer(const Answer& answer) {
+  const std::uint32_t first = lastSerial_ - static_cast<std::uint32_t>(open_.size()) + 1;
+  const std::uint32_t index = answer.replySerial - first;
+  if (index >= open_.size() || open_[index].isAnswered) return;  // to a call that is not open
+  OpenCall& call = open_[index];
+  call.isAnswered = true;
+  --unanswered_;
+  openBytes_ -= call.bytes;
+  pause_ = options_.reconnectMin;  // the service is well
+  if (call.kind == OpenCall::Kind::kMessage) {
+    (answer.isError ? refused_ : acknowledged_).fetch_add(1, std::memory_order_release);
+  }
+  updateWindow();
 }
 
 void ClientWorker::finishFlushes() {
   FlushTicket done = 0;
   while (!open_.empty() && open_.front().isAnswered) {
-    done = open_.front().flush;
+    done = std::max(done, open_.front().flush);
     open_.pop_front();
   }
   if (done == 0) return;

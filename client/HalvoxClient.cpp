@@ -35,15 +35,20 @@ void HalvoxClient::stop(ReporterID id) { impl_->worker.post({id, StopSession{}})
 
 void HalvoxClient::destroySession(ReporterID id) { impl_->worker.post({id, DestroySession{}}); }
 
-bool HalvoxClient::send(ReporterID id, Dictionary message, Category category, EventType type) {
-  return impl_->worker.send({id, std::move(message), category, type});
+bool HalvoxClient::send(ReporterID id, const Dictionary& message, Category category,
+                        EventType type) {
+  return sendTo(std::span(&id, 1), message, category, type);
 }
 
-bool HalvoxClient::send(std::optional<std::vector<ReporterID>> ids, Dictionary message,
-                        Category category, EventType type) {
-  Recipients recipients;
-  if (ids) recipients = std::move(*ids);
-  return impl_->worker.send({std::move(recipients), std::move(message), category, type});
+bool HalvoxClient::send(const std::optional<std::vector<ReporterID>>& ids,
+                        const Dictionary& message, Category category, EventType type) {
+  if (ids) return sendTo(*ids, message, category, type);
+  return impl_->worker.send({std::nullopt, message, category, type});
+}
+
+bool HalvoxClient::sendTo(std::span<const ReporterID> ids, const Dictionary& message,
+                          Category category, EventType type) {
+  return impl_->worker.send({ids, message, category, type});
 }
 
 bool HalvoxClient::flush(std::chrono::milliseconds timeout) { return impl_->worker.flush(timeout); }

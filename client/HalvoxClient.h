@@ -5,6 +5,7 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -50,8 +51,9 @@ struct Options {
   // set; otherwise the user's service, $XDG_RUNTIME_DIR/halvox/reporting.sock, then the system's
   // service, /run/halvox/reporting.sock. It takes the first place at which a service listens.
   std::string socketPath;
-  // Bounds of the messages that wait for the client's thread, in number and in bytes of memory.
-  // Beyond either, send() drops and counts them.
+  // Bounds of the messages that wait for the client's thread, in number and in bytes of memory: a
+  // message takes its size on the wire, rounded up to KiB. Beyond either, send() drops and counts
+  // them. At most 16,777,216 messages and 1 GiB.
   std::size_t maxPendingMessages = 8192;
   std::size_t maxPendingBytes = 8U << 20U;
   // How long making a connection may take.
@@ -84,10 +86,13 @@ struct Counters {
 // new one, connects to it and makes its sessions again: created, typed, configured and, if they
 // were running, started. Messages that are handed over meanwhile wait, up to the bounds.
 //
-// Any thread may call. send() never blocks, takes no lock and does not wait for the service, so an
-// audio thread may call it. It allocates only for a list of several sessions, and makes one system
-// call if the client's thread is asleep. The other operations may wait for a lock for a moment.
-// After fork(), a client works only in the process that made it.
+// Any thread may call. send() encodes the message on the caller's thread, and keeps nothing of it.
+// It never blocks, takes no lock, allocates nothing and does not wait for the service, so an audio
+// thread may call it. While the client has a running session, or has sent a message within the last
+// second, send() makes no system call either; otherwise it makes one, to wake the client's thread.
+// The other operations may wait for a lock for a moment.
+// After fork(), a client works only in the process that made it. In a child flush() returns false
+// at once, and destruction leaves the connection to the parent.
 //
 // The caller owns the client. Construction does not wait for the service and succeeds without one.
 // It throws std::system_error if there is no thread, and std::bad_alloc if there is no memory.
@@ -112,13 +117,17 @@ class HalvoxClient {
 
   // Hands one message over for a session, which may be another client's. Returns false if the
   // message was dropped; see counters().
-  bool send(ReporterID id, Dictionary message, Category category, EventType type);
+  bool send(ReporterID id, const Dictionary& message, Category category, EventType type);
   // The same for several sessions, or without a list for all started sessions of all programs.
-  bool send(std::optional<std::vector<ReporterID>> ids, Dictionary message, Category category,
-            EventType type);
+  bool send(const std::optional<std::vector<ReporterID>>& ids, const Dictionary& message,
+            Category category, EventType type);
+  bool sendTo(std::span<const ReporterID> ids, const Dictionary& message, Category category,
+              EventType type);
 
-  // Blocks until everything handed over before has been answered or lost. Returns false after the
-  // time-out, at once on the client's own thread, and when the client is being destroyed.
+  // Blocks until everything handed over before has been answered or lost. If the client's thread is
+  // asleep, the calling thread does the sending and receiving for up to two milliseconds. Returns
+  // false after the time-out, at once on the client's own thread, and when the client is being
+  // destroyed.
   bool flush(std::chrono::milliseconds timeout);
   // True while a connection to the service exists. Never blocks.
   [[nodiscard]] bool isConnected() const;

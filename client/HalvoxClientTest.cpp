@@ -3,9 +3,13 @@
 #include <atomic>
 #include <chrono>
 #include <cstdlib>
+#include <memory>
 #include <string>
 #include <thread>
 #include <vector>
+
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include "client/HalvoxClientFixture.h"
 
@@ -192,6 +196,123 @@ TEST_F(HalvoxClientTest, DropsWhatExceedsTheBoundInBytes) {
   EXPECT_EQ(client.counters().accepted, 3U);
   EXPECT_EQ(client.counters().dropped, 7U);
   service_.setStalled(false);
+}
+
+TEST_F(HalvoxClientTest, ManyThreadsKeepTheirOrderAndNothingIsLostOrDoubled) {
+  constexpr int kThreads = 6;
+  constexpr std::int64_t kEach = 1500;
+  HalvoxClient client(options());
+  {
+    std::vector<std::jthread> threads;
+    threads.reserve(kThreads);
+    for (int thread = 0; thread < kThreads; ++thread) {
+      threads.emplace_back([&client, thread] {
+        for (std::int64_t number = 0; number < kEach;) {
+          if (client.send(thread, {{"n", number}}, kPlayback, kStart)) {
+            ++number;
+          } else {
+            std::this_thread::yield();
+          }
+        }
+      });
+    }
+  }
+  ASSERT_TRUE(client.flush(kPatience));
+
+  std::vector<std::int64_t> next(kThreads, 0);
+  for (const auto& call : service_.calls()) {
+    if (call.member != "sendMessage") continue;
+    const auto thread = call.arguments.at(3).array()[0].array()[0].toUInt64();
+    EXPECT_EQ(call.arguments.at(0).dictionary().find("n")->toInt64(), next.at(thread)++);
+  }
+  EXPECT_EQ(next, std::vector<std::int64_t>(kThreads, kEach));
+}
+
+TEST_F(HalvoxClientTest, TakesMessagesOfMegabytesAndDropsThoseLargerThanItsBound) {
+  HalvoxClient client(options());
+
+  EXPECT_TRUE(client.send(7, {{"n", 1}, {"text", std::string(6'000'000, 'x')}}, 4, 1));
+  ASSERT_TRUE(client.flush(kPatience));
+  EXPECT_FALSE(client.send(7, {{"n", 2}, {"text", std::string(9'000'000, 'x')}}, 4, 1));
+  EXPECT_TRUE(client.send(7, {{"n", 3}}, 4, 1));
+  ASSERT_TRUE(client.flush(kPatience));
+
+  EXPECT_EQ(numbersReceived(), (std::vector<std::int64_t>{1, 3}));
+  EXPECT_EQ(client.counters().dropped, 1U);
+}
+
+// Without a running session the worker sleeps until a message wakes it.
+TEST_F(HalvoxClientTest, AMessageWakesAClientThatHasBeenQuiet) {
+  HalvoxClient client(options());
+  ASSERT_TRUE(client.flush(kPatience));
+
+  client.send(7, {{"n", 1}}, kPlayback, kStart);
+
+  EXPECT_TRUE(service_.waitForCalls("sendMessage", 1));
+}
+
+TEST_F(HalvoxClientTest, AMessageIsSentWithoutAFlushWhileASessionRuns) {
+  HalvoxClient client(options());
+  client.createSession(7);
+  client.start(7);
+  ASSERT_TRUE(client.flush(kPatience));
+
+  for (std::size_t number = 1; number <= 5; ++number) {
+    client.send(7, {{"n", 1}}, kPlayback, kStart);
+    ASSERT_TRUE(service_.waitForCalls("sendMessage", number));
+  }
+}
+
+TEST_F(HalvoxClientTest, FlushesOfManyThreadsAllEnd) {
+  constexpr int kThreads = 4;
+  constexpr int kEach = 200;
+  HalvoxClient client(options());
+  client.createSession(7);
+  client.start(7);
+  std::atomic<int> failed{0};
+  {
+    std::vector<std::jthread> threads;
+    threads.reserve(kThreads);
+    for (int thread = 0; thread < kThreads; ++thread) {
+      threads.emplace_back([&] {
+        for (int number = 0; number < kEach; ++number) {
+          client.send(7, {{"n", number}}, kPlayback, kStart);
+          if (!client.flush(kPatience)) ++failed;
+        }
+      });
+    }
+  }
+
+  EXPECT_EQ(failed, 0);
+  EXPECT_EQ(client.counters().acknowledged, std::uint64_t{kThreads} * kEach);
+  EXPECT_EQ(service_.count("sendMessage"), std::size_t{kThreads} * kEach);
+}
+
+// The connection is the parent's. The child must neither write to it nor wait for a thread that it
+// does not have.
+TEST_F(HalvoxClientTest, AChildAfterForkLeavesTheParentsConnectionAlone) {
+  auto client = std::make_unique<HalvoxClient>(options());
+  client->createSession(7);
+  client->start(7);
+  ASSERT_TRUE(client->flush(kPatience));
+  client->send(7, {{"n", 1}}, kPlayback, kStart);
+
+  const pid_t child = fork();
+  if (child == 0) {
+    client->send(7, {{"n", 99}}, kPlayback, kStart);
+    const bool flushed = client->flush(kPatience);
+    client.reset();
+    _exit(flushed ? 1 : 0);
+  }
+  int status = -1;
+  ASSERT_EQ(waitpid(child, &status, 0), child);
+  client->send(7, {{"n", 2}}, kPlayback, kStart);
+  ASSERT_TRUE(client->flush(kPatience));
+
+  EXPECT_EQ(status, 0);
+  EXPECT_EQ(numbersReceived(), (std::vector<std::int64_t>{1, 2}));
+  EXPECT_EQ(client->counters().acknowledged, 2U);
+  EXPECT_EQ(client->counters().lost, 0U);
 }
 
 TEST(DefaultSocketPathTest, FollowsTheEnvironment) {

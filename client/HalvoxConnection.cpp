@@ -3,49 +3,26 @@
 #include <map>
 #include <utility>
 
+#include <poll.h>
+
 #include "client/HalvoxClient.h"
-#include "client/PeerBus.h"
-#include "client/WireValue.h"
+#include "client/RequestEncoder.h"
+#include "client/ServiceStream.h"
+#include "platform/linux/connection/wire/ValueDecoder.h"
 
 namespace halvox::client {
 namespace {
 
+namespace dbus = platform::linux_::dbus;
 using Deadline = std::chrono::steady_clock::time_point;
-using BusSlot = platform::linux_::UniqueHandle<sd_bus_slot*, sd_bus_slot_unref>;
 
-// Without a limit, sd_bus_call() would wait for ever for a service that does not answer.
+// At least one look at the socket.
 constexpr std::chrono::milliseconds kShortestTimeout{1};
 // Larger durations could overflow the clock's time points.
 constexpr std::chrono::milliseconds kLongestTimeout = std::chrono::hours(24 * 365);
 
 std::chrono::milliseconds bounded(std::chrono::milliseconds timeout) {
   return std::clamp(timeout, kShortestTimeout, kLongestTimeout);
-}
-
-std::uint64_t toMicroseconds(std::chrono::milliseconds timeout) {
-  return static_cast<std::uint64_t>(std::chrono::microseconds(timeout).count());
-}
-
-struct BusError {
-  sd_bus_error raw = SD_BUS_ERROR_NULL;
-  BusError() = default;
-  ~BusError() { sd_bus_error_free(&raw); }
-  BusError(const BusError&) = delete;
-  BusError& operator=(const BusError&) = delete;
-};
-
-// Handles what has arrived, then waits for more, until the deadline at most. Returns a negative
-// errno if the connection ended or the deadline has passed.
-int processUntil(sd_bus* bus, Deadline deadline) {
-  const int processed = sd_bus_process(bus, nullptr);
-  if (processed < 0) return processed;
-  if (sd_bus_is_open(bus) <= 0) return -ECONNRESET;
-  if (processed > 0) return 0;
-  const auto left = std::chrono::duration_cast<std::chrono::microseconds>(
-      deadline - std::chrono::steady_clock::now());
-  if (left.count() <= 0) return -ETIMEDOUT;
-  const int waited = sd_bus_wait(bus, static_cast<std::uint64_t>(left.count()));
-  return waited == -EINTR ? 0 : std::min(waited, 0);
 }
 
 template <typename T>
@@ -56,66 +33,143 @@ Result<T> failed(Failure failure) {
 Failure senseless() {
   return {Failure::Kind::kRefused, "", "the service's answer has not the type that was expected"};
 }
+Failure timedOut() { return {Failure::Kind::kTimedOut, "", "no answer from the service in time"}; }
+Failure ended() { return {Failure::Kind::kNoService, "", "the service ended the connection"}; }
 
-Result<bool> readBool(sd_bus_message* answer) {
-  int value = 0;
-  if (sd_bus_message_read_basic(answer, 'b', &value) <= 0) return failed<bool>(senseless());
-  return {value != 0, std::nullopt};
+// A frame that answers a call, copied out of the input.
+struct Reply {
+  bool isError = false;
+  std::string frame;
+
+  [[nodiscard]] dbus::Frame read() const {
+    const auto frameOrError = dbus::readFrame(std::as_bytes(std::span(frame)));
+    const auto* valid = std::get_if<dbus::Frame>(&frameOrError);
+    return valid != nullptr ? *valid : dbus::Frame{};
+  }
+  // The only value of an answer with that signature; nothing for any other answer.
+  [[nodiscard]] std::optional<Value> value(std::string_view signature) const {
+    std::vector<Value> values;
+    if (dbus::decodeBody(read(), signature, values) || values.size() != 1) return std::nullopt;
+    return std::move(values.front());
+  }
+};
+
+Failure failureFromError(const Reply& reply) {
+  const dbus::Frame frame = reply.read();
+  // The text of an error is optional, and other values may follow it.
+  std::vector<Value> values;
+  const bool hasText = frame.header.signature.starts_with('s') &&
+                       !dbus::decodeBody(frame, frame.header.signature, values) && !values.empty();
+  return {Failure::Kind::kRefused, std::string(frame.header.errorName),
+          hasText ? std::string(values.front().string()) : "the service gave no reason"};
+}
+
+Result<bool> readBool(const Reply& reply) {
+  if (reply.isError) return failed<bool>(failureFromError(reply));
+  const auto value = reply.value("b");
+  if (!value) return failed<bool>(senseless());
+  return {value->toBool(), std::nullopt};
 }
 
 // The answer to a start, which comes when the session is stopped.
 struct HeldReply {
-  sd_bus* bus = nullptr;
-  BusSlot slot;
+  std::uint32_t serial = 0;
   std::optional<Result<bool>> answer;
 };
-
-int onHeldReply(sd_bus_message* answer, void* userData, sd_bus_error* /*error*/) {
-  auto& held = *static_cast<HeldReply*>(userData);
-  if (sd_bus_is_open(held.bus) <= 0 || sd_bus_message_is_method_error(answer, nullptr) > 0) {
-    held.answer = failed<bool>(failureFromAnswer(held.bus, answer));
-  } else {
-    held.answer = readBool(answer);
-  }
-  return 0;
-}
 
 }  // namespace
 
 class HalvoxConnection::Impl {
  public:
-  Impl(ConnectedBus connected, std::chrono::milliseconds timeout)
+  Impl(ConnectedStream connected, std::chrono::milliseconds timeout)
       : connected_(std::move(connected)), timeout_(bounded(timeout)) {}
 
-  [[nodiscard]] sd_bus* bus() const { return connected_.bus.get(); }
   [[nodiscard]] const std::string& place() const { return connected_.place; }
   [[nodiscard]] const std::vector<TriedPlace>& passedOver() const { return connected_.passedOver; }
+  [[nodiscard]] bool isReady() const { return connected_.stream.isReady(); }
+  [[nodiscard]] bool isOpen() const { return connected_.stream.isOpen(); }
   [[nodiscard]] Deadline deadline() const { return std::chrono::steady_clock::now() + timeout_; }
 
-  Result<BusMessage> ask(Request&& request) {
-    if (auto* failure = std::get_if<Failure>(&request)) {
-      return failed<BusMessage>(std::move(*failure));
-    }
-    BusError error;
-    BusMessage answer;
-    const int result = sd_bus_call(bus(), std::get<BusMessage>(request).get(),
-                                   toMicroseconds(timeout_), &error.raw, answer.out());
-    if (result < 0) return failed<BusMessage>(failureFromCall(result, error.raw));
-    return {std::move(answer), std::nullopt};
+  // Handles what has arrived, or waits for something until the deadline at most. Returns 0 or a
+  // negative errno: -ECONNRESET if the connection has ended, -ETIMEDOUT after the deadline.
+  int processUntil(Deadline deadline) {
+    ServiceStream& stream = connected_.stream;
+    if (!stream.isOpen() || !stream.send()) return -ECONNRESET;
+    const auto left = deadline - std::chrono::steady_clock::now();
+    if (left.count() <= 0) return -ETIMEDOUT;
+    const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(left);
+    const timespec remaining{.tv_sec = seconds.count(), .tv_nsec = (left - seconds).count()};
+    const int events = stream.hasOutput() ? POLLIN | POLLOUT : POLLIN;
+    pollfd polled{stream.fd(), static_cast<short>(events), 0};
+    if (ppoll(&polled, 1, &remaining, nullptr) <= 0) return 0;
+    const bool alive = (polled.revents & ~POLLOUT) == 0 || stream.receive();
+    if (stream.isReady()) takeReplies();
+    return alive && stream.isOpen() ? 0 : -ECONNRESET;
+  }
+
+  // Numbers and appends a frame. Returns its number.
+  std::uint32_t post(std::string&& frame) {
+    if (++lastSerial_ == 0) ++lastSerial_;
+    setSerial(frame.data(), lastSerial_);
+    connected_.stream.append(frame);
+    return lastSerial_;
+  }
+
+  Result<Reply> ask(Request&& request) {
+    if (auto* failure = std::get_if<Failure>(&request)) return failed<Reply>(std::move(*failure));
+    if (!isOpen()) return failed<Reply>(ended());
+    awaited_ = post(std::move(std::get<std::string>(request)));
+    reply_.reset();
+    const Deadline end = deadline();
+    int result = 0;
+    while (!reply_ && result == 0) result = processUntil(end);
+    awaited_ = 0;
+    if (!reply_) return failed<Reply>(result == -ETIMEDOUT ? timedOut() : ended());
+    Reply reply = std::move(*reply_);
+    if (reply.isError) return failed<Reply>(failureFromError(reply));
+    return {std::move(reply), std::nullopt};
   }
 
   Result<bool> askBool(Request&& request) {
     auto answer = ask(std::move(request));
     if (!answer) return failed<bool>(std::move(*answer.failure));
-    return readBool(answer.value->get());
+    return readBool(*answer.value);
   }
 
-  std::map<ReporterID, std::unique_ptr<HeldReply>>& heldReplies() { return heldReplies_; }
+  std::map<ReporterID, HeldReply>& heldReplies() { return heldReplies_; }
 
  private:
-  ConnectedBus connected_;
+  void takeReplies() {
+    for (;;) {
+      const NextFrame next = nextFrame(connected_.stream.input());
+      if (next.state == NextFrame::State::kIncomplete) return;
+      if (next.state == NextFrame::State::kBroken) {
+        connected_.stream.end();
+        return;
+      }
+      if (next.state == NextFrame::State::kAnswer) onAnswer(next.answer);
+      connected_.stream.consume(next.bytes);
+    }
+  }
+
+  void onAnswer(const Answer& answer) {
+    Reply reply{answer.isError, std::string(reinterpret_cast<const char*>(answer.frame.data()),
+                                            answer.frame.size())};
+    if (answer.replySerial == awaited_) {
+      reply_ = std::move(reply);
+      return;
+    }
+    for (auto& [id, held] : heldReplies_) {
+      if (held.serial == answer.replySerial) held.answer = readBool(reply);
+    }
+  }
+
+  ConnectedStream connected_;
   std::chrono::milliseconds timeout_;
-  std::map<ReporterID, std::unique_ptr<HeldReply>> heldReplies_;  // the slots go before the bus
+  std::uint32_t lastSerial_ = 0;
+  std::uint32_t awaited_ = 0;  // the number of the call that ask() waits for; 0: none
+  std::optional<Reply> reply_;
+  std::map<ReporterID, HeldReply> heldReplies_;
 };
 
 HalvoxConnection::HalvoxConnection(std::unique_ptr<Impl> impl) : impl_(std::move(impl)) {}
@@ -129,10 +183,10 @@ Result<std::unique_ptr<HalvoxConnection>> HalvoxConnection::open(
   if (auto* failure = std::get_if<Failure>(&connected)) {
     return failed<Opened>(std::move(*failure));
   }
-  auto impl = std::make_unique<Impl>(std::move(std::get<ConnectedBus>(connected)), timeout);
+  auto impl = std::make_unique<Impl>(std::move(std::get<ConnectedStream>(connected)), timeout);
   const Deadline deadline = impl->deadline();
-  while (sd_bus_is_ready(impl->bus()) <= 0) {
-    if (const int result = processUntil(impl->bus(), deadline); result < 0) {
+  while (!impl->isReady()) {
+    if (const int result = impl->processUntil(deadline); result < 0) {
       return failed<Opened>(
           {result == -ETIMEDOUT ? Failure::Kind::kTimedOut : Failure::Kind::kNoService, "",
            "the service at " + impl->place() + " does not answer"});
@@ -152,44 +206,36 @@ std::vector<std::string> HalvoxConnection::unservedSockets() const {
 }
 
 Result<bool> HalvoxConnection::createReportingSession(ReporterID id) {
-  return impl_->askBool(makeRequest(impl_->bus(), {id, CreateSession{}}));
+  return impl_->askBool(makeRequest(SessionOperation{id, CreateSession{}}));
 }
 
 Result<bool> HalvoxConnection::setServiceType(ServiceType type, ReporterID id) {
-  return impl_->askBool(makeRequest(impl_->bus(), {id, type}));
+  return impl_->askBool(makeRequest(SessionOperation{id, type}));
 }
 
 Result<ServiceType> HalvoxConnection::getServiceNameForReporterID(ReporterID id) {
-  auto answer = impl_->ask(makeRequest(impl_->bus(), "getServiceNameForReporterID", id));
+  auto answer = impl_->ask(makeRequest("getServiceNameForReporterID", id));
   if (!answer) return failed<ServiceType>(std::move(*answer.failure));
-  ServiceType type = 0;
-  if (sd_bus_message_read_basic(answer.value->get(), 'q', &type) <= 0) {
-    return failed<ServiceType>(senseless());
-  }
-  return {type, std::nullopt};
+  const auto type = answer.value->value("q");
+  if (!type) return failed<ServiceType>(senseless());
+  return {static_cast<ServiceType>(type->toUInt64()), std::nullopt};
 }
 
 Result<bool> HalvoxConnection::setConfiguration(const Dictionary& configuration, ReporterID id) {
-  return impl_->askBool(makeRequest(impl_->bus(), {id, configuration}));
+  return impl_->askBool(makeRequest(SessionOperation{id, configuration}));
 }
 
 Result<bool> HalvoxConnection::startReportingSessionForID(ReporterID id) {
-  Request request = makeRequest(impl_->bus(), {id, StartSession{}});
+  Request request = makeRequest(SessionOperation{id, StartSession{}});
   if (auto* failure = std::get_if<Failure>(&request)) return failed<bool>(std::move(*failure));
-  auto held = std::make_unique<HeldReply>();
-  held->bus = impl_->bus();
-  const int result =
-      sd_bus_call_async(impl_->bus(), held->slot.out(), std::get<BusMessage>(request).get(),
-                        onHeldReply, held.get(), kNoTimeout);
-  if (result < 0) return failed<bool>(failureFromCall(result, SD_BUS_ERROR_NULL));
-  const HeldReply& reply = *(impl_->heldReplies()[id] = std::move(held));
+  if (!impl_->isOpen()) return failed<bool>(ended());
+  HeldReply& reply = impl_->heldReplies()[id];
+  reply = {.serial = impl_->post(std::move(std::get<std::string>(request))), .answer = {}};
 
-  // Requests are carried out in order, so this is answered after the start was carried out.
-  auto query = impl_->ask(makeRequest(impl_->bus(), "reporterIDValid", id));
+  // Requests are carried out in order, so this is answered after the start was carried out. The
+  // answer to a refused start has arrived by then.
+  auto query = impl_->ask(makeRequest("reporterIDValid", id));
   if (!query) return failed<bool>(std::move(*query.failure));
-  // The answer to a refused start has arrived by now.
-  while (!reply.answer && sd_bus_process(impl_->bus(), nullptr) > 0) {
-  }
   if (reply.answer && !*reply.answer) return *reply.answer;
   return {true, std::nullopt};
 }
@@ -202,56 +248,50 @@ Result<bool> HalvoxConnection::waitForStartReply(ReporterID id, std::chrono::mil
          "session " + std::to_string(id) + " was not started over this connection"});
   }
   const Deadline deadline = std::chrono::steady_clock::now() + bounded(timeout);
-  while (!found->second->answer) {
-    const int result = processUntil(impl_->bus(), deadline);
-    if (found->second->answer) break;
-    if (result < 0) return failed<bool>(failureFromCall(result, SD_BUS_ERROR_NULL));
-  }
-  return *found->second->answer;
+  const HeldReply& held = found->second;
+  int result = 0;
+  while (!held.answer && result == 0) result = impl_->processUntil(deadline);
+  if (!held.answer) return failed<bool>(result == -ETIMEDOUT ? timedOut() : ended());
+  return *held.answer;
 }
 
 Result<bool> HalvoxConnection::sendMessage(const Dictionary& message, Category category,
                                            EventType type,
                                            const std::optional<std::vector<ReporterID>>& ids) {
-  OutgoingMessage outgoing{
-      .recipients = {}, .message = message, .category = category, .type = type};
-  if (ids) outgoing.recipients = *ids;
-  auto answer = impl_->ask(makeSendMessage(impl_->bus(), outgoing));
+  auto answer = impl_->ask(makeRequest(MessageView{ids, message, category, type}));
   if (!answer) return failed<bool>(std::move(*answer.failure));
   return {true, std::nullopt};
 }
 
 Result<bool> HalvoxConnection::stopReportingSessionForID(ReporterID id) {
-  return impl_->askBool(makeRequest(impl_->bus(), {id, StopSession{}}));
+  return impl_->askBool(makeRequest(SessionOperation{id, StopSession{}}));
 }
 
 Result<bool> HalvoxConnection::destroyReportingSession(ReporterID id) {
-  return impl_->askBool(makeRequest(impl_->bus(), {id, DestroySession{}}));
+  return impl_->askBool(makeRequest(SessionOperation{id, DestroySession{}}));
 }
 
 Result<Dictionary> HalvoxConnection::reporterIDValid(ReporterID id) {
-  auto answer = impl_->ask(makeRequest(impl_->bus(), "reporterIDValid", id));
+  auto answer = impl_->ask(makeRequest("reporterIDValid", id));
   if (!answer) return failed<Dictionary>(std::move(*answer.failure));
-  const auto value = readValue(answer.value->get());
-  if (!value || !value->isDictionary()) return failed<Dictionary>(senseless());
+  const auto value = answer.value->value("a{sv}");
+  if (!value) return failed<Dictionary>(senseless());
   return {value->dictionary(), std::nullopt};
 }
 
 Result<std::vector<ReporterID>> HalvoxConnection::getAllReporters() {
   using IDs = std::vector<ReporterID>;
-  auto answer = impl_->ask(makeRequest(impl_->bus(), "getAllReporters"));
+  auto answer = impl_->ask(makeRequest("getAllReporters"));
   if (!answer) return failed<IDs>(std::move(*answer.failure));
-  const void* ids = nullptr;
-  std::size_t size = 0;
-  if (sd_bus_message_read_array(answer.value->get(), 'x', &ids, &size) < 0) {
-    return failed<IDs>(senseless());
-  }
-  const auto* first = static_cast<const ReporterID*>(ids);
-  return {IDs(first, first + size / sizeof(ReporterID)), std::nullopt};
+  const auto value = answer.value->value("ax");
+  if (!value) return failed<IDs>(senseless());
+  IDs ids;
+  for (const Value& id : value->array()) ids.push_back(id.toInt64());
+  return {std::move(ids), std::nullopt};
 }
 
 Result<bool> HalvoxConnection::killService() {
-  const auto answer = impl_->ask(makeRequest(impl_->bus(), "killService"));
+  const auto answer = impl_->ask(makeRequest("killService"));
   if (answer) return failed<bool>(senseless());
   if (answer.failure->kind == Failure::Kind::kNoService) return {true, std::nullopt};
   return failed<bool>(*answer.failure);

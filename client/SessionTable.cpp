@@ -8,7 +8,9 @@ namespace halvox::client {
 
 void SessionTable::apply(const SessionOperation& operation) {
   if (std::holds_alternative<CreateSession>(operation.step)) {
-    sessions_[operation.id] = {.order = created_++, .type = {}, .configuration = {}};
+    Session& session = sessions_[operation.id];
+    setRunning(session, false);
+    session = {.order = created_++, .type = {}, .configuration = {}};
     return;
   }
   const auto found = sessions_.find(operation.id);
@@ -19,11 +21,24 @@ void SessionTable::apply(const SessionOperation& operation) {
           [](const CreateSession&) {},  // has returned above
           [&](ServiceType type) { session.type = type; },
           [&](const Dictionary& configuration) { session.configuration.merge(configuration); },
-          [&](const StartSession&) { session.running = true; },
-          [&](const StopSession&) { session.running = false; },
-          [&](const DestroySession&) { sessions_.erase(found); },
+          [&](const StartSession&) { setRunning(session, true); },
+          [&](const StopSession&) { setRunning(session, false); },
+          [&](const DestroySession&) {
+            setRunning(session, false);
+            sessions_.erase(found);
+          },
       },
       operation.step);
+}
+
+void SessionTable::setRunning(Session& session, bool running) {
+  if (session.running == running) return;
+  session.running = running;
+  if (running) {
+    ++running_;
+  } else {
+    --running_;
+  }
 }
 
 std::vector<SessionOperation> SessionTable::remake() const {

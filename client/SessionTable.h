@@ -34,6 +34,8 @@ class SessionTable {
   // Returns the operations that make all these sessions, in the order of their creation.
   [[nodiscard]] std::vector<SessionOperation> remake() const;
   [[nodiscard]] std::size_t size() const { return sessions_.size(); }
+  // The number of sessions that are started and not stopped.
+  [[nodiscard]] std::size_t running() const { return running_; }
 
  private:
   struct Session {
@@ -42,7 +44,10 @@ class SessionTable {
     Dictionary configuration;
     bool running = false;
   };
+  void setRunning(Session& session, bool running);
+
   std::map<ReporterID, Session> sessions_;
+  std::size_t running_ = 0;
   std::size_t created_ = 0;
 };
 

@@ -72,5 +72,22 @@ TEST(SessionTableTest, IgnoresOperationsOnSessionsThatAreNotThere) {
   EXPECT_EQ(table.size(), 0U);
 }
 
+TEST(SessionTableTest, CountsRunningSessionsWhateverEndsThem) {
+  SessionTable table = tableAfter({{7, CreateSession{}},
+                                   {7, StartSession{}},
+                                   {7, StartSession{}},
+                                   {8, CreateSession{}},
+                                   {8, StartSession{}},
+                                   {9, CreateSession{}},
+                                   {9, StartSession{}}});
+  EXPECT_EQ(table.running(), 3U);
+
+  table.apply({7, StopSession{}});
+  table.apply({8, DestroySession{}});
+  table.apply({9, CreateSession{}});
+
+  EXPECT_EQ(table.running(), 0U);
+}
+
 }  // namespace
 }  // namespace halvox::client

@@ -12,7 +12,6 @@
 
 #include "client/HalvoxClient.h"
 #include "client/Vocabulary.h"
-#include "client/WireValue.h"
 #include "platform/linux/base/Utf8.h"
 
 // The handles are plain structs around the C++ objects. No exception may leave this file. The calls
@@ -335,8 +334,7 @@ halvox_result halvox_client_send_to(halvox_client* client, const int64_t* ids, s
   const bool idsAreGood = ids != nullptr || count == 0;
   if (client == nullptr || message == nullptr || !idsAreGood) return HALVOX_BAD_ARGUMENT;
   return guarded([&] {
-    std::vector<client::ReporterID> list(ids, ids + count);
-    return sent(client->client.send(std::move(list), message->dictionary, category, type));
+    return sent(client->client.sendTo(std::span(ids, count), message->dictionary, category, type));
   });
 }
 

@@ -226,7 +226,7 @@ typedef struct halvox_options {
   size_t size;
   const char* socket_path;       /* NULL: the usual places, see halvox_default_socket_path() */
   uint64_t max_pending_messages; /* messages that may wait for the client's thread; 0: 8192 */
-  uint64_t max_pending_bytes;    /* their size in memory; 0: 8 MiB */
+  uint64_t max_pending_bytes;    /* their size on the wire, each rounded up to KiB; 0: 8 MiB */
   uint32_t request_timeout_ms;   /* how long making a connection may take; 0: 5000 */
   uint32_t reconnect_min_ms;     /* first pause between attempts to connect; 0: 50 */
   uint32_t reconnect_max_ms;     /* longest pause, after several attempts; 0: 2000 */
@@ -297,14 +297,15 @@ HALVOX_API halvox_result halvox_client_destroy_session(halvox_client* client, in
  * halvox_client_counters() counts both. `category` is a HALVOX_CATEGORY_... number, optionally with
  * a domain, `type` is a HALVOX_EVENT_... number.
  *
- * An audio thread may call the send functions: they never block, take a lock or wait for the
- * service. With a dictionary made in advance, halvox_client_send() and halvox_client_send_to_all()
- * do not allocate either. They make one system call if the client's thread is asleep. */
+ * An audio thread may call the send functions: they encode the message, keep nothing of it, and
+ * never block, allocate, take a lock or wait for the service. While the client has a running
+ * session, or has sent a message within the last second, they make no system call either; otherwise
+ * they make one, to wake the client's thread. */
 HALVOX_API halvox_result halvox_client_send(halvox_client* client, int64_t id,
                                             const halvox_dictionary* message, uint32_t category,
                                             uint16_t type);
-/* The same for several sessions; allocates for the list. With a count of 0 the service accepts the
- * message and gives it to no session; `ids` may then be NULL. */
+/* The same for several sessions. With a count of 0 the service accepts the message and gives it to
+ * no session; `ids` may then be NULL. */
 HALVOX_API halvox_result halvox_client_send_to(halvox_client* client, const int64_t* ids,
                                                size_t count, const halvox_dictionary* message,
                                                uint32_t category, uint16_t type);

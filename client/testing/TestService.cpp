@@ -12,7 +12,7 @@
 #include <sys/socket.h>
 #include <sys/un.h>
 
-#include "client/WireValue.h"
+#include "client/testing/BusValue.h"
 
 namespace halvox::client {
 namespace {

@@ -1,0 +1,112 @@
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <limits>
+#include <memory>
+
+#include "client/RequestEncoder.h"
+
+namespace halvox::client {
+
+// Passes messages from any number of threads to one, as frames that are ready for the wire, bounded
+// in number and in bytes.
+//
+//                   pop                  publish                   take
+//   free cells ─────────────► a frame ──────────────► slots ─────────────► the consumer
+//       ▲                                                                      │
+//       └──────────────────────────── release(), many at once ─────────────────┘
+//
+// The memory of frames is cells of 1 KiB. A frame takes as many as it needs, and needs no other
+// memory. Freed cells are used again first, so that a client whose thread keeps up touches few of
+// them. Each frame then gets a position, which is the order, and a slot.
+//
+// A producer takes no lock, allocates nothing and makes no system call. It repeats a step only if
+// another thread has made the same step meanwhile, and so cannot be held up by a thread that is
+// interrupted. A producer that is interrupted between its position and its slot delays the
+// consumer, but no other producer.
+//
+// Rejected: a list of dictionaries, encoded by the consumer. The program's next change of a
+// dictionary would then have to copy it, on the audio thread. One ring of bytes: all of it is in
+// memory after the first lap, and 8 MiB for each audio process are too many.
+class FrameRing {
+ public:
+  // Throws std::bad_alloc.
+  FrameRing(std::size_t maxFrames, std::size_t maxBytes);
+  FrameRing(const FrameRing&) = delete;
+  FrameRing& operator=(const FrameRing&) = delete;
+
+  // Any thread may call. kNoRoom if a bound is reached. Only kDone changes anything.
+  EncodeOutcome tryPush(const MessageView& message);
+  // The number of frames accepted so far, which is the position of the next one.
+  [[nodiscard]] std::uint64_t tail() const { return tail_.load(std::memory_order_seq_cst); }
+
+  // Only the consumer may call the following functions.
+  // The position of the oldest frame in the ring.
+  [[nodiscard]] std::uint64_t head() const { return head_; }
+  // True if there is a frame and its producer has finished writing it.
+  [[nodiscard]] bool isReady() const;
+  // The size of the oldest frame. Call this and take() only if isReady().
+  [[nodiscard]] std::size_t frontBytes() const { return slot(head_).bytes; }
+  // Copies the oldest frame to `to`, or nowhere if that is null, and removes it.
+  void take(char* to);
+  // Gives the room of removed frames back to the producers.
+  void release();
+
+ private:
+  using CellNumber = std::uint32_t;
+  static constexpr CellNumber kNoCell = std::numeric_limits<CellNumber>::max();
+  static constexpr std::size_t kCellBytes = 1024;
+
+  struct Slot {
+    // Position + 1 once the frame is complete. Orders the frame before its consumption, and, being
+    // sequentially consistent, after a consumer's announcement that it goes to sleep.
+    std::atomic<std::uint64_t> ready{0};
+    CellNumber firstCell = kNoCell;
+    std::uint32_t bytes = 0;
+  };
+  // Cells in the order of their `next` numbers.
+  struct Chain {
+    CellNumber first = kNoCell;
+    CellNumber last = kNoCell;
+  };
+  class ChainSource;
+  struct Unmap {
+    std::size_t bytes = 0;
+    void operator()(char* memory) const;
+  };
+
+  static std::unique_ptr<char, Unmap> map(std::size_t bytes);
+  [[nodiscard]] Slot& slot(std::uint64_t position) const { return slots_[position & mask_]; }
+  [[nodiscard]] char* cell(CellNumber number) const {
+    return memory_.get() + std::size_t{number} * kCellBytes;
+  }
+  [[nodiscard]] std::atomic<CellNumber>& next(CellNumber number) const { return next_[number]; }
+  CellNumber popCell();
+  void pushCells(const Chain& chain);
+  [[nodiscard]] bool isFullAt(std::uint64_t position) const;
+  [[nodiscard]] bool reservePosition(std::uint64_t& position);
+
+  const std::uint64_t maxFrames_;
+  const std::uint64_t mask_;
+  const CellNumber cells_;
+  const std::unique_ptr<Slot[]> slots_;
+  const std::unique_ptr<char, Unmap> memory_;
+  const std::unique_ptr<std::atomic<CellNumber>[]> next_;  // the cell after each cell
+  // Each on a cache line of its own: producers write the first three, the consumer the last.
+  // Low half: the first free cell + 1, or 0. High half: a count of changes, because a cell may be
+  // popped and pushed between another thread's load and exchange. Acquire and release order the
+  // consumer's reading of a cell before its reuse.
+  alignas(64) std::atomic<std::uint64_t> free_{0};
+  // Cells from here on have never been used.
+  alignas(64) std::atomic<CellNumber> fresh_{0};
+  alignas(64) std::atomic<std::uint64_t> tail_{0};
+  // Positions below have been released. Acquire and release order the emptying of a slot before its
+  // reuse.
+  alignas(64) std::atomic<std::uint64_t> released_{0};
+  alignas(64) std::uint64_t head_ = 0;
+  Chain taken_;
+};
+
+}  // namespace halvox::client

@@ -1,0 +1,456 @@
+#include "client/RequestEncoder.h"
+
+#include <array>
+#include <bit>
+#include <cstring>
+#include <string_view>
+#include <utility>
+
+#include "client/Overloaded.h"
+#include "platform/linux/base/Utf8.h"
+#include "platform/linux/connection/wire/Frame.h"
+#include "platform/linux/connection/wire/HeaderFields.h"
+
+namespace halvox::client {
+namespace {
+
+namespace dbus = platform::linux_::dbus;
+using dbus::HeaderField;
+using platform::NumberKind;
+using platform::ValueKind;
+
+constexpr std::string_view kObjectPath = "/com/tarno/halvox/reporting";
+constexpr std::string_view kInterface = "com.tarno.halvox.HVReportingServiceProtocol";
+
+// ---- Headers
+
+// A header without serial and length of the body: the same bytes for every call of a method.
+struct Header {
+  std::array<char, 192> bytes{};
+  std::size_t size = 0;
+
+  constexpr void byte(char value) { bytes[size++] = value; }
+  constexpr void align() { size = (size + 7) & ~std::size_t{7}; }
+  constexpr void put(std::size_t at, std::uint32_t number) {
+    for (unsigned index = 0; index < sizeof number; ++index) {
+      const unsigned shift = std::endian::native == std::endian::little ? index : 3 - index;
+      bytes[at + index] = static_cast<char>(number >> (8 * shift));
+    }
+  }
+  constexpr void characters(std::string_view text) {
+    for (const char character : text) byte(character);
+    byte('\0');
+  }
+  constexpr void field(HeaderField code, char type, std::string_view text) {
+    align();
+    byte(static_cast<char>(code));
+    byte(1);
+    byte(type);
+    byte('\0');
+    put(size, static_cast<std::uint32_t>(text.size()));
+    size += sizeof(std::uint32_t);
+    characters(text);
+  }
+  constexpr void signature(std::string_view text) {
+    align();
+    byte(static_cast<char>(HeaderField::kSignature));
+    byte(1);
+    byte('g');
+    byte('\0');
+    byte(static_cast<char>(text.size()));
+    characters(text);
+  }
+};
+
+constexpr Header makeHeader(std::string_view member, std::string_view signature) {
+  Header header;
+  header.byte(std::endian::native == std::endian::little ? 'l' : 'B');
+  header.byte(static_cast<char>(dbus::MessageType::kMethodCall));
+  header.byte('\0');
+  header.byte(static_cast<char>(dbus::kProtocolVersion));
+  header.size = dbus::kFrameStartBytes;
+  header.field(HeaderField::kPath, 'o', kObjectPath);
+  header.field(HeaderField::kInterface, 's', kInterface);
+  header.field(HeaderField::kMember, 's', member);
+  if (!signature.empty()) header.signature(signature);
+  header.put(dbus::kFieldsLengthOffset,
+             static_cast<std::uint32_t>(header.size - dbus::kFrameStartBytes));
+  header.align();
+  return header;
+}
+
+constexpr Header kSendMessage = makeHeader("sendMessage", "a{sv}uqaax");
+
+// Appends the header. The length of the body is set at the end of the body.
+template <typename Body>
+void writeFrame(SegmentWriter& writer, const Header& header, const Body& body) {
+  writer.bytes(header.bytes.data(), dbus::kBodyLengthOffset);
+  char* const length = writer.length();
+  const std::size_t rest = dbus::kSerialOffset;
+  writer.bytes(header.bytes.data() + rest, header.size - rest);
+  const std::size_t start = writer.position();
+  body();
+  SegmentWriter::replaceLength(length, writer.position() - start);
+}
+
+// ---- Values
+
+// Copies a text whose length is seldom a constant and mostly small. memcpy() would be a call.
+inline char* copyText(char* to, std::string_view text) {
+  const std::size_t size = text.size();
+  if (size >= 8 && size <= 32) {
+    const char* from = text.data();
+    std::memcpy(to, from, 8);
+    if (size > 16) {
+      std::memcpy(to + 8, from + 8, 8);
+      std::memcpy(to + size - 16, from + size - 16, 8);
+    }
+    std::memcpy(to + size - 8, from + size - 8, 8);
+  } else {
+    std::memcpy(to, text.data(), size);
+  }
+  to[size] = '\0';
+  return to + size + 1;
+}
+
+// Appends zeros up to a multiple of 8 or 4. Writes up to 8 bytes beyond.
+inline char* padded(char* at, std::size_t alignment) {
+  std::memset(at, 0, 8);
+  const std::size_t misaligned = reinterpret_cast<std::uintptr_t>(at) & (alignment - 1);
+  return misaligned == 0 ? at : at + (alignment - misaligned);
+}
+
+template <typename Number>
+inline char* put(char* at, Number number) {
+  std::memcpy(at, &number, sizeof number);
+  return at + sizeof number;
+}
+
+template <typename Number>
+inline char* putNumber(char* at, char type, Number number) {
+  at = put(at, std::array<char, 3>{1, type, 0});
+  return put(padded(at, sizeof number), number);
+}
+
+inline char* putNumber(char* at, const Value& value) {
+  switch (value.numberKind()) {
+    case NumberKind::kBool:
+      return putNumber(at, 'b', static_cast<std::uint32_t>(value.toBool()));
+    case NumberKind::kUInt8:
+      return put(put(at, std::array<char, 3>{1, 'y', 0}),
+                 static_cast<std::uint8_t>(value.toUInt64()));
+    case NumberKind::kInt16:
+      return putNumber(at, 'n', static_cast<std::int16_t>(value.toInt64()));
+    case NumberKind::kUInt16:
+      return putNumber(at, 'q', static_cast<std::uint16_t>(value.toUInt64()));
+    case NumberKind::kInt32:
+      return putNumber(at, 'i', static_cast<std::int32_t>(value.toInt64()));
+    case NumberKind::kUInt32:
+      return putNumber(at, 'u', static_cast<std::uint32_t>(value.toUInt64()));
+    case NumberKind::kInt64:
+      return putNumber(at, 'x', value.toInt64());
+    case NumberKind::kUInt64:
+      return putNumber(at, 't', value.toUInt64());
+    case NumberKind::kFloat:
+    case NumberKind::kDouble:
+      return putNumber(at, 'd', value.toDouble());
+  }
+  return at;
+}
+
+// Signature, padding and number need at most this much, padded() included.
+constexpr std::size_t kNumberRoom = 24;
+// The same for an entry besides its texts: padding, two lengths, two NULs and a signature.
+constexpr std::size_t kEntryRoom = 16 + kNumberRoom;
+
+// Appends values and remembers why one cannot be sent. If there is a `path`, it gets the place of
+// that value in the message.
+class ValueWriter {
+ public:
+  explicit ValueWriter(SegmentWriter& writer, std::string* path = nullptr)
+      : writer_(writer), path_(path) {}
+
+  bool append(const Dictionary& dictionary) {
+    if (!enter()) return false;
+    char* const length = writer_.length();
+    writer_.align(8);
+    const std::size_t start = writer_.position();
+    for (const auto& [key, value] : dictionary) {
+      if (!appendEntry(key.text(), value)) {
+        notePlace(std::string_view(key.text()));
+        return false;
+      }
+    }
+    return leaveArray(length, start);
+  }
+
+  [[nodiscard]] std::string error() const {
+    return path_ == nullptr || path_->empty() ? reason_ : "\"" + *path_ + "\": " + reason_;
+  }
+
+ private:
+  bool fail(const char* reason) {
+    reason_ = reason;
+    return false;
+  }
+  bool enter(unsigned levels = 1) {
+    depth_ += levels;
+    return depth_ <= dbus::kMaxNesting || fail("nested too deep");
+  }
+  bool leave(unsigned levels = 1) {
+    depth_ -= levels;
+    return true;
+  }
+  bool leaveArray(char* length, std::size_t start) {
+    const std::size_t bytes = writer_.position() - start;
+    if (bytes > dbus::kMaxArrayBytes) return fail("longer than 64 MiB, the limit of D-Bus");
+    SegmentWriter::replaceLength(length, bytes);
+    return leave();
+  }
+  // Without room there is no use in going on, and a large message would take long.
+  [[nodiscard]] bool mayGoOn() const { return !writer_.isFull(); }
+
+  void notePlace(std::string_view key) {
+    if (path_ == nullptr) return;
+    const bool joined = path_->empty() || path_->front() == '[';
+    path_->insert(0, std::string(key) + (joined ? "" : "."));
+  }
+  void notePlace(std::size_t index) {
+    if (path_ == nullptr) return;
+    const bool joined = path_->empty() || path_->front() == '[';
+    path_->insert(0, "[" + std::to_string(index) + "]" + (joined ? "" : "."));
+  }
+
+  bool appendEntry(std::string_view key, const Value& value) {
+    if (!platform::linux_::isUtf8WithoutNul(key)) return fail("the key is not UTF-8 without NUL");
+    // Nearly all entries are numbers and short texts, and do not cross the border of a segment.
+    const std::string_view text = value.string();
+    char* at = writer_.reserve(key.size() + text.size() + kEntryRoom);
+    if (at != nullptr && depth_ < dbus::kMaxNesting) {
+      if (value.isNumber()) {
+        writer_.commit(putNumber(putKey(at, key), value));
+        return true;
+      }
+      if (value.isString()) {
+        if (!isText(text)) return false;
+        at = put(putKey(at, key), std::array<char, 3>{1, 's', 0});
+        at = put(padded(at, 4), static_cast<std::uint32_t>(text.size()));
+        writer_.commit(copyText(at, text));
+        return true;
+      }
+    }
+    writer_.align(8);
+    writeText(key);
+    return mayGoOn() && appendVariant(value);
+  }
+
+  static char* putKey(char* at, std::string_view key) {
+    return copyText(put(padded(at, 8), static_cast<std::uint32_t>(key.size())), key);
+  }
+
+  bool isText(std::string_view text) {
+    return platform::linux_::isUtf8WithoutNul(text) || fail("the text is not UTF-8 without NUL");
+  }
+  void writeText(std::string_view text) {
+    writer_.number(static_cast<std::uint32_t>(text.size()));
+    writer_.bytes(text.data(), text.size());
+    writer_.bytes("", 1);
+  }
+  void writeSignature(std::string_view signature) {
+    writer_.number(static_cast<std::uint8_t>(signature.size()));
+    writer_.bytes(signature.data(), signature.size());
+    writer_.bytes("", 1);
+  }
+
+  bool appendVariant(const Value& value) {
+    switch (value.kind()) {
+      case ValueKind::kNone:
+        return fail("there is no value");
+      case ValueKind::kNumber:
+        return appendNumber(value);
+      case ValueKind::kString:
+        return appendString(value.string());
+      case ValueKind::kDate:
+        return appendDate(value.date());
+      case ValueKind::kData:
+        return appendData(value.data());
+      case ValueKind::kArray:
+        return appendArray(value.array());
+      case ValueKind::kDictionary:
+        writeSignature("a{sv}");
+        return enter() && append(value.dictionary()) && leave();
+    }
+    return fail("a value of an unknown kind");
+  }
+
+  bool appendNumber(const Value& value) {
+    if (!enter()) return false;
+    // Made at a multiple of 8 first: its padding depends on where it begins.
+    alignas(8) std::array<char, 8 + kNumberRoom> made{};
+    const std::size_t misaligned = writer_.position() % 8;
+    const char* const end = putNumber(made.data() + misaligned, value);
+    writer_.bytes(made.data() + misaligned,
+                  static_cast<std::size_t>(end - made.data()) - misaligned);
+    return leave();
+  }
+
+  bool appendString(std::string_view text) {
+    if (!enter()) return false;
+    if (!isText(text)) return false;
+    if (text.size() > dbus::kMaxMessageBytes) return fail("longer than a message can be");
+    writeSignature("s");
+    writeText(text);
+    return leave();
+  }
+
+  bool appendDate(platform::Date date) {
+    if (!enter(2)) return false;
+    writeSignature("(d)");
+    writer_.align(8);
+    writer_.number(date.secondsSince1970);
+    return leave(2);
+  }
+
+  bool appendData(const platform::Data& data) {
+    if (!enter(2)) return false;
+    const auto bytes = data.bytes();
+    if (bytes.size() > dbus::kMaxArrayBytes) return fail("longer than 64 MiB, the limit of D-Bus");
+    writeSignature("ay");
+    writer_.number(static_cast<std::uint32_t>(bytes.size()));
+    writer_.bytes(bytes.data(), bytes.size());
+    return leave(2);
+  }
+
+  bool appendArray(const platform::Array& array) {
+    if (!enter(2)) return false;
+    writeSignature("av");
+    char* const length = writer_.length();
+    const std::size_t start = writer_.position();
+    for (std::size_t index = 0; index < array.size(); ++index) {
+      if (mayGoOn() && appendVariant(array[index])) continue;
+      notePlace(index);
+      return false;
+    }
+    return leaveArray(length, start) && leave();
+  }
+
+  SegmentWriter& writer_;
+  unsigned depth_ = 0;
+  const char* reason_ = "";
+  std::string* path_;  // of the caller; null if nobody asks for it
+};
+
+void appendRecipients(SegmentWriter& writer,
+                      const std::optional<std::span<const ReporterID>>& recipients) {
+  char* const outer = writer.length();
+  const std::size_t start = writer.position();
+  if (recipients) {
+    char* const inner = writer.length();
+    writer.align(8);
+    const std::size_t first = writer.position();
+    writer.bytes(recipients->data(), recipients->size_bytes());
+    SegmentWriter::replaceLength(inner, writer.position() - first);
+  }
+  SegmentWriter::replaceLength(outer, writer.position() - start);
+}
+
+bool encodeMessage(SegmentWriter& writer, ValueWriter& values, const MessageView& message) {
+  bool hasForm = true;
+  writeFrame(writer, kSendMessage, [&] {
+    hasForm = values.append(message.message);
+    if (!hasForm) return;
+    writer.number(message.category);
+    writer.number(message.type);
+    appendRecipients(writer, message.recipients);
+  });
+  return hasForm;
+}
+
+Failure badRequest(std::string message) {
+  return {Failure::Kind::kBadRequest, "", std::move(message)};
+}
+
+Request finish(const SegmentWriter& writer, const HeapSegments& segments) {
+  if (writer.position() > dbus::kMaxMessageBytes) {
+    return badRequest("the request is longer than 128 MiB, the limit of D-Bus");
+  }
+  return segments.join(writer.position());
+}
+
+template <typename Body>
+Request make(const Header& header, const Body& body) {
+  HeapSegments segments;
+  SegmentWriter writer(segments);
+  writeFrame(writer, header, [&] { body(writer); });
+  return finish(writer, segments);
+}
+
+Request makeSetConfiguration(ReporterID id, const Dictionary& configuration) {
+  std::string path;
+  std::optional<std::string> error;
+  Request request = make(makeHeader("setConfiguration", "a{sv}x"), [&](SegmentWriter& writer) {
+    ValueWriter values(writer, &path);
+    if (!values.append(configuration)) error = values.error();
+    writer.number(id);
+  });
+  if (error) return badRequest(*error);
+  return request;
+}
+
+Request makeSetServiceType(ReporterID id, ServiceType type) {
+  return make(makeHeader("setServiceType", "qx"), [&](SegmentWriter& writer) {
+    writer.number(type);
+    writer.number(id);
+  });
+}
+
+}  // namespace
+
+EncodeOutcome encodeMessage(SegmentWriter& writer, const MessageView& message) {
+  ValueWriter values(writer);
+  const bool hasForm = encodeMessage(writer, values, message);
+  if (writer.isFull()) return EncodeOutcome::kNoRoom;
+  if (!hasForm || writer.position() > dbus::kMaxMessageBytes) return EncodeOutcome::kNoWireForm;
+  return EncodeOutcome::kDone;
+}
+
+Request makeRequest(const MessageView& message) {
+  std::string path;
+  HeapSegments segments;
+  SegmentWriter writer(segments);
+  ValueWriter values(writer, &path);
+  if (!encodeMessage(writer, values, message)) return badRequest(values.error());
+  return finish(writer, segments);
+}
+
+Request makeRequest(const char* member) {
+  return make(makeHeader(member, ""), [](SegmentWriter&) {});
+}
+
+Request makeRequest(const char* member, ReporterID id) {
+  return make(makeHeader(member, "x"), [id](SegmentWriter& writer) { writer.number(id); });
+}
+
+Request makeRequest(const SessionOperation& operation) {
+  const ReporterID id = operation.id;
+  return std::visit(
+      Overloaded{
+          [&](const CreateSession&) { return makeRequest("createReportingSession", id); },
+          [&](ServiceType type) { return makeSetServiceType(id, type); },
+          [&](const Dictionary& configuration) { return makeSetConfiguration(id, configuration); },
+          [&](const StartSession&) { return makeRequest("startReportingSessionForID", id); },
+          [&](const StopSession&) { return makeRequest("stopReportingSessionForID", id); },
+          [&](const DestroySession&) { return makeRequest("destroyReportingSession", id); },
+      },
+      operation.step);
+}
+
+void setSerial(char* frame, std::uint32_t serial) {
+  std::memcpy(frame + dbus::kSerialOffset, &serial, sizeof serial);
+}
+
+void setNoReplyExpected(char* frame) {
+  frame[dbus::kFlagsOffset] = static_cast<char>(dbus::kNoReplyExpected);
+}
+
+}  // namespace halvox::client

@@ -1,0 +1,103 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <cstring>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace halvox::client {
+
+// A piece of memory to write into. It begins at a multiple of 8 and its size is one.
+struct Segment {
+  char* begin = nullptr;
+  char* end = nullptr;
+};
+
+// Where a SegmentWriter gets its memory from. The caller owns it.
+class SegmentSource {
+ public:
+  SegmentSource() = default;
+  virtual ~SegmentSource() = default;
+  SegmentSource(const SegmentSource&) = delete;
+  SegmentSource& operator=(const SegmentSource&) = delete;
+
+  // The next piece, or an empty one if there is no more room.
+  virtual Segment next() = 0;
+};
+
+// Writes a frame of the wire, in the byte order of this machine, into one or several segments. The
+// frame starts with the first segment. Because segments are multiples of 8, no number crosses the
+// border of two segments, and addresses have the alignment of positions in the frame.
+//
+// Without room the writer does nothing more, and isFull() is true. Belongs to one thread. Does not
+// own `source`, which must outlive it.
+class SegmentWriter {
+ public:
+  explicit SegmentWriter(SegmentSource& source) : source_(source) {}
+
+  [[nodiscard]] bool isFull() const { return full_; }
+  // The number of bytes so far.
+  [[nodiscard]] std::size_t position() const {
+    return before_ + static_cast<std::size_t>(at_ - begin_);
+  }
+
+  // Appends zeros. No alignment is larger than 8.
+  void align(std::size_t alignment) {
+    while ((reinterpret_cast<std::uintptr_t>(at_) & (alignment - 1)) != 0) *at_++ = 0;
+  }
+  // Appends padding, then the number: the alignment of a number is its size.
+  template <typename Number>
+  void number(Number number) {
+    align(sizeof number);
+    if (at_ == end_ && !extend()) return;
+    std::memcpy(at_, &number, sizeof number);
+    at_ += sizeof number;
+  }
+  void bytes(const void* from, std::size_t size);
+  // Appends a length of 0 to be replaced later by replaceLength(). The result is valid as long as
+  // the segments are.
+  [[nodiscard]] char* length() {
+    align(sizeof(std::uint32_t));
+    if (at_ == end_ && !extend()) return spare_;
+    std::memset(at_, 0, sizeof(std::uint32_t));
+    at_ += sizeof(std::uint32_t);
+    return at_ - sizeof(std::uint32_t);
+  }
+  static void replaceLength(char* at, std::size_t length) {
+    const auto number = static_cast<std::uint32_t>(length);
+    std::memcpy(at, &number, sizeof number);
+  }
+
+  // For the common case of a part that fits into the current segment: returns where to write, or
+  // null if fewer than `size` bytes are left there. commit() ends the part.
+  [[nodiscard]] char* reserve(std::size_t size) {
+    return static_cast<std::size_t>(end_ - at_) >= size ? at_ : nullptr;
+  }
+  void commit(char* end) { at_ = end; }
+
+ private:
+  bool extend();
+
+  SegmentSource& source_;
+  char* begin_ = nullptr;
+  char* at_ = nullptr;
+  char* end_ = nullptr;
+  std::size_t before_ = 0;  // bytes in earlier segments
+  bool full_ = false;
+  alignas(8) char spare_[8] = {};  // takes a length that has no room
+};
+
+// Segments on the heap, for frames that are made where an allocation does not matter.
+class HeapSegments final : public SegmentSource {
+ public:
+  Segment next() override;
+  // The first `size` bytes of all segments in one piece.
+  [[nodiscard]] std::string join(std::size_t size) const;
+
+ private:
+  std::vector<std::vector<std::uint64_t>> segments_;
+};
+
+}  // namespace halvox::client
