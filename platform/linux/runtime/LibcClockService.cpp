@@ -1,16 +1,13 @@
 #include "platform/linux/runtime/LibcClockService.h"
 
 #include <algorithm>
-#include <charconv>
 #include <cmath>
 #include <cstdint>
 #include <ctime>
-#include <optional>
-#include <string_view>
 
 #include <unistd.h>
 
-#include "platform/linux/base/WholeFile.h"
+#include "platform/linux/base/ProcessStat.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -21,37 +18,16 @@ std::chrono::nanoseconds read(clockid_t clock) {
   return std::chrono::seconds(time.tv_sec) + std::chrono::nanoseconds(time.tv_nsec);
 }
 
-// The start time in the text of /proc/self/stat, in clock ticks after the start of the system.
-std::optional<std::int64_t> startTicks(std::string_view stat) {
-  // The command name may contain spaces and parentheses, so the fields are counted from its end.
-  constexpr int kFieldsAfterName = 20;  // the start time is field 22
-  const std::size_t end = stat.rfind(')');
-  if (end == std::string_view::npos) return std::nullopt;
-  std::string_view rest = stat.substr(end + 1);
-  for (int field = 0; field < kFieldsAfterName; ++field) {
-    const std::size_t blank = rest.find(' ');
-    if (blank == std::string_view::npos) return std::nullopt;
-    rest.remove_prefix(blank + 1);
-  }
-  std::int64_t ticks = 0;
-  const auto result = std::from_chars(rest.data(), rest.data() + rest.size(), ticks);
-  if (result.ec != std::errc{}) return std::nullopt;
-  return ticks;
-}
-
 std::chrono::nanoseconds ownStart() {
   // The kernel counts the start of a process by this clock, which includes the time that the
   // machine was suspended.
   const std::chrono::nanoseconds now = read(CLOCK_BOOTTIME);
-  const FileContent stat =
-      readWholeFile({.path = "/proc/self/stat", .most = 1024, .excess = FileToRead::Excess::kCut});
+  const auto stat = readOwnProcessStat();
   const std::int64_t ticksPerSecond = ::sysconf(_SC_CLK_TCK);
-  if (stat.bytes.empty() || ticksPerSecond <= 0) return now;
-  const auto ticks = startTicks(stat.bytes);
-  if (!ticks.has_value()) return now;
+  if (!stat.has_value() || ticksPerSecond <= 0) return now;
   const std::chrono::nanoseconds tick =
       std::chrono::nanoseconds(std::chrono::seconds(1)) / ticksPerSecond;
-  return std::min(now, *ticks * tick);
+  return std::min(now, static_cast<std::int64_t>(stat->startTicks) * tick);
 }
 
 }  // namespace

@@ -2,9 +2,10 @@
 
 #include <csignal>
 #include <fstream>
+#include <string>
 #include <thread>
 
-#include "platform/linux/base/WholeFile.h"
+#include "platform/linux/base/ProcessStat.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -12,20 +13,11 @@ namespace {
 // The process is not our child, so there is nothing to wait on.
 constexpr std::chrono::milliseconds kLookEvery{10};
 
+// Empty if there is no such process, or if it has ended and its parent has not waited for it.
 std::string startTimeOf(pid_t pid) {
-  const std::string path = "/proc/" + std::to_string(pid) + "/stat";
-  const std::string text = readWholeFile({.path = path.c_str(), .most = 4096}).bytes;
-  // The process name may contain anything, and ends at the last ")". The start time is field 22.
-  const std::size_t name = text.rfind(')');
-  if (name == std::string::npos) return {};
-  constexpr int kFieldsBetween = 20;
-  std::size_t at = name;
-  for (int field = 0; field < kFieldsBetween && at != std::string::npos; ++field) {
-    at = text.find(' ', at + 1);
-  }
-  // A zombie has ended and only waits for its parent.
-  if (at == std::string::npos || text.compare(name, 3, ") Z") == 0) return {};
-  return text.substr(at + 1, text.find(' ', at + 1) - at - 1);
+  const auto stat = readProcessStat(pid);
+  if (!stat.has_value() || stat->state == 'Z') return {};
+  return std::to_string(stat->startTicks);
 }
 
 }  // namespace

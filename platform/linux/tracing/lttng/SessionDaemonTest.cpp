@@ -15,6 +15,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ProcessStat.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
@@ -63,10 +64,8 @@ class SessionDaemonTest : public testing::Test {
   }
   static bool isThere(pid_t pid) { return ::kill(pid, 0) == 0; }
   static std::string startTimeOf(pid_t pid) {
-    std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
-    std::string field;
-    for (int number = 0; number < 22; ++number) file >> field;
-    return field;
+    const auto stat = readProcessStat(pid);
+    return stat.has_value() ? std::to_string(stat->startTicks) : "none";
   }
   // The keeper that was started last; 0 if none runs.
   static pid_t keeper() {

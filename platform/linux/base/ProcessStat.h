@@ -1,0 +1,29 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string_view>
+
+#include <sys/types.h>
+
+namespace halvox::platform::linux_ {
+
+// What /proc/<pid>/stat says about a process. See proc(5).
+struct ProcessStat {
+  char state = '?';            // field 3: 'Z' has ended, but its parent has not waited for it
+  std::uint64_t startTicks{};  // field 22: clock ticks from the start of the system to its start
+};
+
+// Parses the text of such a file. None if it ends before the start time does, or is malformed. The
+// command name in it may contain blanks, parentheses and line ends: a process chooses its own.
+[[nodiscard]] std::optional<ProcessStat> parseProcessStat(std::string_view text);
+
+// Reads the file of a process; none if there is no such process. Does not block. Any thread may
+// call.
+[[nodiscard]] std::optional<ProcessStat> readProcessStat(pid_t pid);
+
+// The same for this process. Also correct if /proc shows the processes of another PID namespace,
+// where this process has another number than getpid() returns.
+[[nodiscard]] std::optional<ProcessStat> readOwnProcessStat();
+
+}  // namespace halvox::platform::linux_
