@@ -13,9 +13,6 @@ namespace halvox {
 namespace {
 
 using platform::Dictionary;
-using platform::LogLevel;
-using platform::Message;
-using platform::Value;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using Event = platform::FakePowerLogService::Event;
@@ -27,7 +24,7 @@ class HVReportingJoulebookUtilityTest : public testing::Test {
     platform_.log.clear();
   }
 
-  void handle(const Message& message, AudioEventType type = AudioEventType::kJoulebook) {
+  void handle(const platform::Message& message, AudioEventType type = AudioEventType::kJoulebook) {
     HVReportingJoulebookUtility::handleEvent(message, AudioEventCategory::kOutput, type, session_,
                                              PowerLogCounters(platform_.statistics));
   }
@@ -66,7 +63,7 @@ TEST_F(HVReportingJoulebookUtilityTest, AnEngineReportWithoutATimeIsLoggedAsAnEr
                                 {{"EngineOnDuration", 4.5}, {"ApplicationName", "A"}},
                                 std::nullopt}));
   ASSERT_EQ(platform_.log.lines().size(), 1U);
-  const auto line = platform_.log.lines(LogLevel::kError).front();
+  const auto line = platform_.log.lines(platform::LogLevel::kError).front();
   EXPECT_EQ(line.text, "failed to get HVReporting timestamp for joulebook");
   EXPECT_EQ(line.category, "hvrp");
 }
@@ -79,7 +76,8 @@ TEST_F(HVReportingJoulebookUtilityTest, AnApplicationWithoutANameIsUnknown) {
 
   handle(Dictionary{{"EngineOnTime", 1}, {"hvreporting_timestamp", 2}});
 
-  EXPECT_EQ(*platform_.powerLog.events().front().payload.find("ApplicationName"), Value("Unknown"));
+  EXPECT_EQ(*platform_.powerLog.events().front().payload.find("ApplicationName"),
+            platform::Value("Unknown"));
   EXPECT_THAT(platform_.log.lines(), IsEmpty());
 }
 
@@ -123,7 +121,7 @@ TEST_F(HVReportingJoulebookUtilityTest, ValuesReachTheLogAsTheyCame) {
 
   const Dictionary payload = platform_.powerLog.events().front().payload;
   EXPECT_TRUE(payload.find("EngineOnDuration")->dictionary().isIdenticalTo(nested));
-  EXPECT_EQ(*payload.find("TimestampEnd"), Value("late"));
+  EXPECT_EQ(*payload.find("TimestampEnd"), platform::Value("late"));
 }
 
 TEST_F(HVReportingJoulebookUtilityTest, AMessageOfNeitherKindLogsNothing) {

@@ -14,16 +14,14 @@ namespace halvox {
 namespace {
 
 using platform::Dictionary;
-using platform::LogLevel;
-using platform::Message;
 using platform::Value;
-using testing::ElementsAre;
 using testing::IsEmpty;
 using zubmetrics::AudioIssueDetected;
 
 class HVReportingZUBBridgeTest : public testing::Test {
  protected:
-  void handle(const Message& message, AudioEventType type = AudioEventType::kIssueDetector) {
+  void handle(const platform::Message& message,
+              AudioEventType type = AudioEventType::kIssueDetector) {
     HVReportingZUBBridge::handleEvent(message, AudioEventCategory::kPlayback, type, nullptr,
                                       IssueMetricCounters(platform_.statistics));
   }
@@ -68,11 +66,12 @@ TEST_F(HVReportingZUBBridgeTest, AnIssueIsPostedWithAllItsFieldsAndNoTimestamp) 
 TEST_F(HVReportingZUBBridgeTest, AnEmptyIssueIsLoggedFieldByFieldAndPosted) {
   handle(Dictionary{});
 
-  EXPECT_THAT(platform_.log.texts(LogLevel::kError),
-              ElementsAre("Failed to get issue_type for AudioIssueDetected",
-                          "Failed to get rtaid_client for AudioIssueDetected",
-                          "Failed to get node for AudioIssueDetected",
-                          "Failed to get any_channel_silence_seconds for AudioIssueDetected"));
+  EXPECT_THAT(
+      platform_.log.texts(platform::LogLevel::kError),
+      testing::ElementsAre("Failed to get issue_type for AudioIssueDetected",
+                           "Failed to get rtaid_client for AudioIssueDetected",
+                           "Failed to get node for AudioIssueDetected",
+                           "Failed to get any_channel_silence_seconds for AudioIssueDetected"));
   EXPECT_EQ(platform_.log.lines().size(), 4U);
   EXPECT_EQ(platform_.log.lines().front().category, "hvra");
   EXPECT_THAT(platform_.log.lines().front().line,
@@ -84,8 +83,9 @@ TEST_F(HVReportingZUBBridgeTest, AnEmptyIssueIsLoggedFieldByFieldAndPosted) {
 TEST_F(HVReportingZUBBridgeTest, OneMissingKeyIsOneLineAndTheRestIsPosted) {
   handle(Dictionary{{"issue_type", "glitch"}, {"rtaid_client", "x"}, {"node", "mixer"}});
 
-  EXPECT_THAT(platform_.log.texts(),
-              ElementsAre("Failed to get any_channel_silence_seconds for AudioIssueDetected"));
+  EXPECT_THAT(
+      platform_.log.texts(),
+      testing::ElementsAre("Failed to get any_channel_silence_seconds for AudioIssueDetected"));
   EXPECT_EQ(posted().issueType(), "glitch");
   EXPECT_EQ(posted().duration(), 0);
 }

@@ -7,11 +7,9 @@ namespace halvox {
 namespace {
 
 using platform::Array;
-using platform::Dictionary;
 using platform::LogLevel;
 using platform::Value;
 using testing::ElementsAre;
-using testing::IsEmpty;
 using Lookup = HVReportingClientServerInstance::Lookup;
 
 class HVReportingClientServerInstanceTest : public ServiceFixture {
@@ -134,7 +132,7 @@ TEST_F(HVReportingClientServerInstanceTest, TheSecondConnectionErrorDoesNothing)
   clientOf(client_)->handleConnectionError();
   run();
 
-  EXPECT_THAT(steps(), IsEmpty());
+  EXPECT_THAT(steps(), testing::IsEmpty());
 }
 
 TEST_F(HVReportingClientServerInstanceTest, InterruptionAndInvalidationCleanUpOnce) {
@@ -173,7 +171,7 @@ TEST_F(HVReportingClientServerInstanceTest, ResourceUseFollowsSessionsAndTheirCo
   EXPECT_EQ(client->resourceUse().sessions, 2U);
   EXPECT_EQ(client->resourceUse().bytes, 0U);
 
-  call(client_, "setConfiguration", {Dictionary{{"a", std::string(1000, 'x')}}, 7});
+  call(client_, "setConfiguration", {platform::Dictionary{{"a", std::string(1000, 'x')}}, 7});
   EXPECT_GE(client->resourceUse().bytes, 1000U);
   send(client_, {8}, {{"a", std::string(2000, 'x')}});
   EXPECT_GE(client->resourceUse().bytes, 3000U);

@@ -11,7 +11,6 @@ using platform::Dictionary;
 using platform::LogLevel;
 using testing::ElementsAre;
 using testing::IsEmpty;
-using testing::UnorderedElementsAre;
 using namespace std::chrono_literals;
 
 class HVReportingServiceDelegateTest : public ServiceFixture {
@@ -21,6 +20,12 @@ class HVReportingServiceDelegateTest : public ServiceFixture {
     for (const auto& client : delegate_->getAllClients())
       pids.push_back(client->processIdentifier());
     return pids;
+  }
+  void expectStepsOfAnEndWithoutUptime() {
+    EXPECT_THAT(steps(),
+                ElementsAre("clientStartDate is nil. clientpid=100 clientprocessname=unknown",
+                            "invalidationHandler: connection exited process=unknown uptime_sec=-1",
+                            "clientProcessName is nil. clientpid=100"));
   }
   std::vector<std::int64_t> activeIDs() const {
     std::vector<std::int64_t> ids;
@@ -198,10 +203,7 @@ TEST_F(HVReportingServiceDelegateTest, AConnectionThatEndsBeforeItsRegistrationH
 
   connection->invalidate();
 
-  EXPECT_THAT(steps(),
-              ElementsAre("clientStartDate is nil. clientpid=100 clientprocessname=unknown",
-                          "invalidationHandler: connection exited process=unknown uptime_sec=-1",
-                          "clientProcessName is nil. clientpid=100"));
+  expectStepsOfAnEndWithoutUptime();
   EXPECT_EQ(lines(LogLevel::kDefault).size(), 3U);
   EXPECT_THAT(platform_.analytics.sentNames(), IsEmpty());
 }
@@ -213,10 +215,7 @@ TEST_F(HVReportingServiceDelegateTest, AConnectionWithoutItsClientHasNoUptime) {
 
   connection->invalidate();
 
-  EXPECT_THAT(steps(),
-              ElementsAre("clientStartDate is nil. clientpid=100 clientprocessname=unknown",
-                          "invalidationHandler: connection exited process=unknown uptime_sec=-1",
-                          "clientProcessName is nil. clientpid=100"));
+  expectStepsOfAnEndWithoutUptime();
 }
 
 TEST_F(HVReportingServiceDelegateTest, AClientWithoutANameSendsNoUptimeEvent) {
@@ -305,7 +304,7 @@ TEST_F(HVReportingServiceDelegateTest, ActiveSessionsComeInTheOrderOfTheirClient
 
   const auto ids = activeIDs();
   ASSERT_EQ(ids.size(), 3U);
-  EXPECT_THAT((std::vector{ids[0], ids[1]}), UnorderedElementsAre(4, 5));
+  EXPECT_THAT((std::vector{ids[0], ids[1]}), testing::UnorderedElementsAre(4, 5));
   EXPECT_EQ(ids[2], 1);
 }
 

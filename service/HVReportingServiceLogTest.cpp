@@ -3,11 +3,8 @@
 namespace halvox {
 namespace {
 
-using platform::Dictionary;
 using platform::LogLevel;
-using platform::Value;
 using testing::ElementsAre;
-using testing::IsEmpty;
 using testing::StartsWith;
 
 // Which lines each request logs, with category and level. People and programs filter by them.
@@ -91,7 +88,7 @@ TEST_F(HVReportingServiceLogTest, ConfigurationAndQueries) {
   create(client_, 7);
   platform_.log.clear();
 
-  call(client_, "setConfiguration", {Dictionary{{"a", 1}}, 7});
+  call(client_, "setConfiguration", {platform::Dictionary{{"a", 1}}, 7});
   EXPECT_THAT(logged(), ElementsAre("debug hvrs: setting configuration"));
 
   call(client_, "reporterIDValid", {7});
@@ -99,7 +96,7 @@ TEST_F(HVReportingServiceLogTest, ConfigurationAndQueries) {
                                     "default hvrs: validating reporter 7"));
 
   call(client_, "getAllReporters", {});
-  EXPECT_THAT(logged(), IsEmpty());
+  EXPECT_THAT(logged(), testing::IsEmpty());
 }
 
 TEST_F(HVReportingServiceLogTest, StartAndStop) {

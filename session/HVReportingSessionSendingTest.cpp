@@ -15,7 +15,6 @@ namespace {
 using platform::Dictionary;
 using platform::JournalEntry;
 using platform::JournalKind;
-using platform::LogLevel;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::Pair;
@@ -60,7 +59,7 @@ TEST_F(HVReportingSessionSendingTest, LogsThenEmitsItsTracePoint) {
       platform_.journal.entries(),
       ElementsAre(JournalEntry{JournalKind::kLogLine, "sending message for session owned by 7"},
                   JournalEntry{JournalKind::kTracePoint, "0x21044838"}));
-  EXPECT_EQ(platform_.log.lines().back().level, LogLevel::kDebug);
+  EXPECT_EQ(platform_.log.lines().back().level, platform::LogLevel::kDebug);
 }
 
 TEST_F(HVReportingSessionSendingTest, RecordsTheMessageCleanedAndTagged) {
@@ -103,7 +102,7 @@ TEST_F(HVReportingSessionSendingTest, DroppingIsLoggedBetweenTheFirstLineAndTheT
       ElementsAre(JournalEntry{JournalKind::kLogLine, "sending message for session owned by 7"},
                   JournalEntry{JournalKind::kLogLine, "dropping redundant event"},
                   JournalEntry{JournalKind::kTracePoint, "0x21044838"}));
-  EXPECT_EQ(platform_.log.lines().back().level, LogLevel::kDebug);
+  EXPECT_EQ(platform_.log.lines().back().level, platform::LogLevel::kDebug);
 }
 
 class VolatileKeyTest : public HVReportingSessionSendingTest,
@@ -241,7 +240,7 @@ TEST_F(HVReportingSessionSendingTest, BeforeTheStartAMessageIsSentAsASingleOneAS
   platform_.dispatch.runUntilIdle();
 
   EXPECT_THAT(
-      platform_.log.texts(LogLevel::kDebug),
+      platform_.log.texts(platform::LogLevel::kDebug),
       ElementsAre("entering tlmreporting "
                   "-[HVReportingSession sendMessage:category:type:sync:reply:]_block_invoke",
                   "session not started, will send as a single message",

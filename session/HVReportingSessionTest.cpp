@@ -16,7 +16,6 @@ namespace {
 
 using platform::Dictionary;
 using platform::JournalEntry;
-using platform::JournalKind;
 using platform::LogLevel;
 using testing::ElementsAre;
 using testing::IsEmpty;
@@ -35,16 +34,19 @@ class HVReportingSessionTest : public testing::Test {
                         AudioEventType::kStart, nullptr);
   }
   std::vector<JournalEntry> steps() const {
-    return platform_.journal.entries({JournalKind::kLogLine, JournalKind::kTracePoint});
+    return platform_.journal.entries(
+        {platform::JournalKind::kLogLine, platform::JournalKind::kTracePoint});
   }
   void forgetSteps() {
     platform_.journal.clear();
     platform_.log.clear();
     platform_.kdebug.clear();
   }
-  static JournalEntry line(std::string text) { return {JournalKind::kLogLine, std::move(text)}; }
+  static JournalEntry line(std::string text) {
+    return {platform::JournalKind::kLogLine, std::move(text)};
+  }
   static JournalEntry point(std::string code) {
-    return {JournalKind::kTracePoint, std::move(code)};
+    return {platform::JournalKind::kTracePoint, std::move(code)};
   }
 
   platform::FakePlatform platform_;

@@ -16,8 +16,6 @@ namespace {
 using platform::Dictionary;
 using platform::LogLevel;
 using testing::ElementsAre;
-using testing::IsEmpty;
-using testing::Pair;
 
 const std::string kDirectory =
     "/private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
@@ -57,7 +55,7 @@ TEST_F(SessionSummaryFileTest, ItsDirectoryIsMadeForEverybody) {
 
   session_->stop();
 
-  EXPECT_THAT(platform_.files.directories(), ElementsAre(Pair(kDirectory, 511U)));
+  EXPECT_THAT(platform_.files.directories(), ElementsAre(testing::Pair(kDirectory, 511U)));
 }
 
 TEST_F(SessionSummaryFileTest, IsNamedByLocalTimeApplicationAndService) {
@@ -127,7 +125,7 @@ TEST_F(SessionSummaryFileTest, ItsPathIsLoggedAtInfoLevel) {
 TEST_F(SessionSummaryFileTest, AnEmptyHistoryWritesNoFile) {
   session_->stop();
 
-  EXPECT_THAT(platform_.files.steps(), IsEmpty());
+  EXPECT_THAT(platform_.files.steps(), testing::IsEmpty());
 }
 
 TEST_F(SessionSummaryFileTest, AStopWithoutAStartWritesNoFile) {

@@ -14,8 +14,6 @@ namespace halvox {
 namespace {
 
 using platform::Dictionary;
-using platform::LogLevel;
-using platform::Message;
 using platform::Value;
 using testing::ElementsAre;
 using testing::IsEmpty;
@@ -40,9 +38,9 @@ TEST_F(SessionSummaryTest, JoinsTheValuesOfAKeyInOrderOfTheHistory) {
   send({{"foo", 2}});
 
   EXPECT_EQ(session_->createSummaryEventForSession(),
-            Message(Dictionary{{"HV_Session_Summary_Event", "3"},
-                               {"foo", "1,2"},
-                               {"audiotag", "PlaybackStart,PlaybackStart"}}));
+            platform::Message(Dictionary{{"HV_Session_Summary_Event", "3"},
+                                         {"foo", "1,2"},
+                                         {"audiotag", "PlaybackStart,PlaybackStart"}}));
 }
 
 TEST_F(SessionSummaryTest, KeysThatOnlySomeMessagesHaveAreJoinedToo) {
@@ -112,7 +110,7 @@ TEST_F(SessionSummaryTest, WithoutVolumeThereIsASummaryEventAlone) {
               ElementsAre("ending session 7", "ending session 7", "0x21044830",
                           "sending summary event for reporter 7",
                           "sending message for session owned by 7", "0x21044838"));
-  EXPECT_THAT(platform_.log.texts(LogLevel::kDefault),
+  EXPECT_THAT(platform_.log.texts(platform::LogLevel::kDefault),
               ElementsAre("sending summary event for reporter 7"));
   EXPECT_EQ(platform_.log.lines().back().category, "hvrr");
 }
@@ -142,7 +140,7 @@ TEST_F(SessionSummaryTest, VolumeIsLoggedAtDefaultLevelOnce) {
   session_->stop();
 
   EXPECT_THAT(
-      platform_.log.texts(LogLevel::kDefault),
+      platform_.log.texts(platform::LogLevel::kDefault),
       ElementsAre("sending volume event for reporter 7", "sending summary event for reporter 7"));
 }
 
@@ -216,7 +214,7 @@ TEST_F(SessionSummaryTest, TheSummaryHasAllBitsOfItsCategoryAndTypeSet) {
   session_->stop();
   platform_.dispatch.runUntilIdle();
 
-  const auto lines = platform_.log.texts(LogLevel::kDebug);
+  const auto lines = platform_.log.texts(platform::LogLevel::kDebug);
   EXPECT_EQ(
       std::ranges::count_if(
           lines, [](const auto& text) { return text.ends_with(" : category -1 : type 65535"); }),
@@ -230,7 +228,7 @@ TEST_F(SessionSummaryTest, VolumesThatNeverPlayedSendNoVolumeEvent) {
 
   session_->stop();
 
-  EXPECT_THAT(platform_.log.texts(LogLevel::kDefault),
+  EXPECT_THAT(platform_.log.texts(platform::LogLevel::kDefault),
               ElementsAre("sending summary event for reporter 7"));
   EXPECT_THAT(platform_.analytics.sentNames(), IsEmpty());
 }

@@ -23,8 +23,6 @@ namespace {
 
 namespace fs = std::filesystem;
 using testing::ElementsAre;
-using testing::HasSubstr;
-using testing::IsEmpty;
 
 constexpr uid_t kNobody = 65534;
 
