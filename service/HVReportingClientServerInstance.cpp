@@ -78,12 +78,20 @@ void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
 
 // The I/O thread may run the brief requests itself. Starts, stops and destroys are not brief: they
 // can wait for the drivers, a trace or a file, and would hold up every connection meanwhile.
+template <typename Member, typename Reply>
+void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
+                                                   RequestContext&& context, Member carryOut,
+                                                   ReporterID reporterID, Reply&& reply) {
+  queueRequest(weight, std::move(context),
+               [carryOut, reporterID, reply = std::forward<Reply>(reply)](auto& client) {
+                 (client.*carryOut)(reporterID, reply);
+               });
+}
+
 void HVReportingClientServerInstance::createReportingSession(ReporterID reporterID, BoolReply reply,
                                                              RequestContext context) {
   queueRequest(platform::JobWeight::kBrief, std::move(context),
-               [reporterID, reply = std::move(reply)](auto& client) {
-                 client.carryOutCreate(reporterID, reply);
-               });
+               &HVReportingClientServerInstance::carryOutCreate, reporterID, std::move(reply));
 }
 
 void HVReportingClientServerInstance::setServiceType(AudioServiceType serviceType,
@@ -99,9 +107,8 @@ void HVReportingClientServerInstance::getServiceNameForReporterID(ReporterID rep
                                                                   ServiceTypeReply reply,
                                                                   RequestContext context) {
   queueRequest(platform::JobWeight::kBrief, std::move(context),
-               [reporterID, reply = std::move(reply)](auto& client) {
-                 client.carryOutGetServiceName(reporterID, reply);
-               });
+               &HVReportingClientServerInstance::carryOutGetServiceName, reporterID,
+               std::move(reply));
 }
 
 void HVReportingClientServerInstance::setConfiguration(platform::Dictionary configuration,
@@ -119,9 +126,7 @@ void HVReportingClientServerInstance::startReportingSessionForID(ReporterID repo
                                                                  BoolReply reply,
                                                                  RequestContext context) {
   queueRequest(platform::JobWeight::kMayBlock, std::move(context),
-               [reporterID, reply = std::move(reply)](auto& client) {
-                 client.carryOutStart(reporterID, reply);
-               });
+               &HVReportingClientServerInstance::carryOutStart, reporterID, std::move(reply));
 }
 
 void HVReportingClientServerInstance::sendMessage(platform::Message message,
@@ -142,26 +147,21 @@ void HVReportingClientServerInstance::stopReportingSessionForID(ReporterID repor
                                                                 BoolReply reply,
                                                                 RequestContext context) {
   queueRequest(platform::JobWeight::kMayBlock, std::move(context),
-               [reporterID, reply = std::move(reply)](auto& client) {
-                 client.carryOutStop(reporterID, reply);
-               });
+               &HVReportingClientServerInstance::carryOutStop, reporterID, std::move(reply));
 }
 
 void HVReportingClientServerInstance::destroyReportingSession(ReporterID reporterID,
                                                               BoolReply reply,
                                                               RequestContext context) {
   queueRequest(platform::JobWeight::kMayBlock, std::move(context),
-               [reporterID, reply = std::move(reply)](auto& client) {
-                 client.carryOutDestroy(reporterID, reply);
-               });
+               &HVReportingClientServerInstance::carryOutDestroy, reporterID, std::move(reply));
 }
 
 void HVReportingClientServerInstance::reporterIDValid(ReporterID reporterID, DictionaryReply reply,
                                                       RequestContext context) {
   queueRequest(platform::JobWeight::kBrief, std::move(context),
-               [reporterID, reply = std::move(reply)](auto& client) {
-                 client.carryOutReporterIDValid(reporterID, reply);
-               });
+               &HVReportingClientServerInstance::carryOutReporterIDValid, reporterID,
+               std::move(reply));
 }
 
 void HVReportingClientServerInstance::getAllReporters(ReportersReply reply,

@@ -102,6 +102,10 @@ class HVReportingClientServerInstance final
   // the request's token until then.
   template <typename Work>
   void queueRequest(platform::JobWeight weight, RequestContext&& context, Work work);
+  // Queues a request that needs only a reporter ID and its reply.
+  template <typename Member, typename Reply>
+  void queueRequest(platform::JobWeight weight, RequestContext&& context, Member carryOut,
+                    ReporterID reporterID, Reply&& reply);
 
   // The work of the requests, on the reporting queue.
   void carryOutCreate(ReporterID reporterID, const BoolReply& reply);
