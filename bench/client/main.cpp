@@ -124,11 +124,11 @@ Client makeClient(const std::string& socketPath) {
 
 enum class Use { kPrepared, kChanged, kBuilt };
 
-std::uint64_t pending(halvox_client* client) {
+std::int64_t pending(halvox_client* client) {
   halvox_counters counters{};
   counters.size = sizeof counters;
   halvox_client_counters(client, &counters);
-  return counters.pending;
+  return static_cast<std::int64_t>(counters.pending);
 }
 
 // CPU of the library for each message, at full speed but without a loss.
@@ -145,8 +145,9 @@ Values pipelineLibrary(const std::string& socketPath, std::int64_t count, Use us
     if (halvox_client_send(client.get(), kReporter, message.get(), 4, 18) != HALVOX_OK) {
       throw std::runtime_error("a message was dropped");
     }
-    while (number % 64 == 0 && pending(client.get()) > 4096) {
-      std::this_thread::sleep_for(std::chrono::microseconds(500));
+    // As many as keep the library busy, but not so many that their memory leaves the cache.
+    while (number % 64 == 0 && pending(client.get()) > 4 * kWindow) {
+      std::this_thread::sleep_for(std::chrono::microseconds(100));
     }
   }
   if (halvox_client_flush(client.get(), 60'000) != HALVOX_OK) throw std::runtime_error("no answer");

@@ -1,0 +1,235 @@
+// What an audio thread may rely on: it counts the system calls, allocations and locks of a thread
+// that sends through the shared library as programs use it.
+
+#include <atomic>
+#include <cerrno>
+#include <chrono>
+#include <csignal>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <thread>
+
+#include <dlfcn.h>
+#include <gtest/gtest.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <pthread.h>
+#include <sys/prctl.h>
+#include <sys/syscall.h>
+#include <ucontext.h>
+
+#include "client/halvox.h"
+#include "client/testing/TestService.h"
+
+namespace {
+
+// Counted on the threads that ask for it only.
+thread_local bool counts = false;
+thread_local int allocations = 0;
+thread_local int locks = 0;
+std::atomic<int> systemCalls{0};
+
+void countAllocation() {
+  if (counts) ++allocations;
+}
+
+}  // namespace
+
+// The program's definitions of these functions are used by all libraries in the process.
+extern "C" {
+void* __libc_malloc(std::size_t size);                     // NOLINT(bugprone-reserved-identifier)
+void* __libc_calloc(std::size_t count, std::size_t size);  // NOLINT(bugprone-reserved-identifier)
+void* __libc_realloc(void* memory, std::size_t size);      // NOLINT(bugprone-reserved-identifier)
+void __libc_free(void* memory);                            // NOLINT(bugprone-reserved-identifier)
+
+void* malloc(std::size_t size) {
+  countAllocation();
+  return __libc_malloc(size);
+}
+void* calloc(std::size_t count, std::size_t size) {
+  countAllocation();
+  return __libc_calloc(count, size);
+}
+void* realloc(void* memory, std::size_t size) {
+  countAllocation();
+  return __libc_realloc(memory, size);
+}
+void free(void* memory) {
+  if (memory != nullptr) countAllocation();
+  __libc_free(memory);
+}
+int pthread_mutex_lock(pthread_mutex_t* mutex) {
+  using Lock = int (*)(pthread_mutex_t*);
+  static const auto next = reinterpret_cast<Lock>(dlsym(RTLD_NEXT, "pthread_mutex_lock"));
+  if (counts) ++locks;
+  return next(mutex);
+}
+}
+
+namespace {
+
+using halvox::client::ScratchDirectory;
+using halvox::client::TestService;
+
+struct ClientFree {
+  void operator()(halvox_client* client) const { halvox_client_free(client); }
+};
+struct DictionaryFree {
+  void operator()(halvox_dictionary* dictionary) const { halvox_dictionary_free(dictionary); }
+};
+
+void onSystemCall(int /*signal*/, siginfo_t* /*info*/, void* context) {
+  ++systemCalls;
+  auto& registers = static_cast<ucontext_t*>(context)->uc_mcontext;
+#if defined(__x86_64__)
+  registers.gregs[REG_RAX] = -ENOSYS;
+#elif defined(__aarch64__)
+  registers.regs[0] = static_cast<std::uint64_t>(-ENOSYS);
+#endif
+}
+
+// From here on every system call of this thread fails and is counted, except those that end it.
+bool trapSystemCalls() {
+  struct sigaction action {};
+  action.sa_sigaction = onSystemCall;
+  action.sa_flags = SA_SIGINFO;
+  sigaction(SIGSYS, &action, nullptr);
+  sock_filter instructions[] = {
+      BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+      BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_exit, 2, 0),
+      BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_rt_sigreturn, 1, 0),
+      BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_TRAP),
+      BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW),
+  };
+  const sock_fprog program{.len = std::size(instructions), .filter = instructions};
+  return prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
+         prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program) == 0;
+}
+
+struct Counts {
+  bool trapped = false;
+  int systemCalls = 0;
+  int allocations = 0;
+  int locks = 0;
+};
+
+// Runs work on a thread of its own and counts what it does.
+template <typename Work>
+Counts count(const Work& work) {
+  Counts result;
+  std::thread([&] {
+    // The first allocation of a thread maps memory for it, which is not what is counted here.
+    halvox_dictionary_free(halvox_dictionary_new());
+    systemCalls = 0;
+    result.trapped = trapSystemCalls();
+    counts = true;
+    work();
+    counts = false;
+    result.systemCalls = systemCalls;
+    result.allocations = allocations;
+    result.locks = locks;
+  }).join();
+  return result;
+}
+
+class RealTimeTest : public testing::Test {
+ protected:
+  RealTimeTest() : service_(scratch_.path("reporting.sock")) {
+    const std::string path = scratch_.path("reporting.sock");
+    halvox_options options{};
+    options.size = sizeof options;
+    options.socket_path = path.c_str();
+    client_.reset(halvox_client_new(&options));
+    message_.reset(halvox_dictionary_new());
+    halvox_dictionary_set_int64(message_.get(), "frame_counter", 1);
+    halvox_dictionary_set_double(message_.get(), "sample_rate", 48000.0);
+    halvox_dictionary_set_bool(message_.get(), "is_running", true);
+    halvox_dictionary_set_string(message_.get(), "device_uid", "alsa_output.pci-0000_00_1f.3");
+    halvox_client_create_session(client_.get(), 7);
+    halvox_client_start(client_.get(), 7);
+    EXPECT_EQ(halvox_client_flush(client_.get(), 20'000), HALVOX_OK);
+  }
+
+  void sendMany(int messages) const {
+    const std::int64_t ids[] = {7, 8};
+    for (int number = 0; number < messages; ++number) {
+      halvox_client_send(client_.get(), 7, message_.get(), 4, 18);
+      halvox_client_send_to(client_.get(), ids, 2, message_.get(), 4, 18);
+      halvox_client_send_to_all(client_.get(), message_.get(), 4, 18);
+    }
+  }
+  static void expectNothing(const Counts& counted) {
+    ASSERT_TRUE(counted.trapped);
+    EXPECT_EQ(counted.systemCalls, 0);
+    EXPECT_EQ(counted.allocations, 0);
+    EXPECT_EQ(counted.locks, 0);
+  }
+  [[nodiscard]] halvox_counters counters() const {
+    halvox_counters now{};
+    now.size = sizeof now;
+    halvox_client_counters(client_.get(), &now);
+    return now;
+  }
+
+  ScratchDirectory scratch_;
+  TestService service_;
+  std::unique_ptr<halvox_client, ClientFree> client_;
+  std::unique_ptr<halvox_dictionary, DictionaryFree> message_;
+};
+
+// Without this the other tests could pass because nothing is counted.
+TEST_F(RealTimeTest, SystemCallsAndAllocationsAreCounted) {
+  const Counts counted = count([&] {
+    syscall(SYS_getpid);
+    halvox_dictionary_free(halvox_dictionary_new());
+  });
+
+  ASSERT_TRUE(counted.trapped);
+  EXPECT_EQ(counted.systemCalls, 1);
+  EXPECT_EQ(counted.allocations, 2);
+}
+
+TEST_F(RealTimeTest, LocksAreCounted) {
+  locks = 0;
+  counts = true;
+  halvox_client_stop(client_.get(), 9);
+  counts = false;
+
+  EXPECT_GE(locks, 1);
+}
+
+TEST_F(RealTimeTest, SendingWhileASessionRunsMakesNoSystemCallAllocationOrLock) {
+  expectNothing(count([&] { sendMany(1000); }));
+
+  ASSERT_EQ(halvox_client_flush(client_.get(), 20'000), HALVOX_OK);
+  EXPECT_EQ(counters().acknowledged, 3000U);
+}
+
+TEST_F(RealTimeTest, ChangingANumberAndSendingAgainAllocatesNothing) {
+  expectNothing(count([&] {
+    for (int number = 0; number < 1000; ++number) {
+      halvox_dictionary_set_int64(message_.get(), "frame_counter", number);
+      halvox_client_send(client_.get(), 7, message_.get(), 4, 18);
+    }
+  }));
+}
+
+TEST_F(RealTimeTest, SendingIntoAFullRingMakesNoneEither) {
+  service_.setStalled(true);
+
+  expectNothing(count([&] { sendMany(5000); }));
+
+  EXPECT_GT(counters().dropped, 0U);
+  service_.setStalled(false);
+}
+
+TEST_F(RealTimeTest, SendingWithoutAServiceMakesNoneEither) {
+  service_.vanish();
+  ASSERT_TRUE(
+      halvox::client::eventually([&] { return !halvox_client_is_connected(client_.get()); }));
+
+  expectNothing(count([&] { sendMany(1000); }));
+}
+
+}  // namespace
