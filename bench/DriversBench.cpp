@@ -19,7 +19,6 @@
 
 #include <malloc.h>
 
-#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/LinuxIOReportService.h"
 #include "platform/linux/drivers/textfile/TextfileSource.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
@@ -206,13 +205,12 @@ int main(int argc, char** argv) {
   if (mkdtemp(name.data()) == nullptr) return 1;
   const std::filesystem::path directory(name);
   writeFiles(directory, 1);
-  static ShownLog log;
-  ownDriversCategory() = &log;
   {
+    ShownLog log;
     CounterStatisticsService statistics;
     std::vector<std::unique_ptr<DriverSource>> sources;
-    sources.push_back(std::make_unique<TextfileSource>(directory));
-    LinuxIOReportService service(std::move(sources), statistics);
+    sources.push_back(std::make_unique<TextfileSource>(directory, log));
+    LinuxIOReportService service(std::move(sources), log, statistics);
     service.open();
     const Sampler sampler(service);
     if (isOfMemory) {

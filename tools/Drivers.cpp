@@ -12,7 +12,6 @@
 #include <poll.h>
 
 #include "platform/linux/drivers/ConfiguredSources.h"
-#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/LinuxIOReportService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
 #include "tools/JsonText.h"
@@ -232,15 +231,13 @@ ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream
   const Complaint complain("drivers", form, out, errors);
   const auto configuration = serviceConfiguration(complain);
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
-  // Static, because the sources' log keeps a reference to it.
-  static ErrorLog errorLog;
-  platform::linux_::ownDriversCategory() = &errorLog;
+  ErrorLog errorLog;
   // The sources count what they refuse. Nobody reads the counters of this program.
   platform::linux_::CounterStatisticsService statistics;
   platform::linux_::LinuxIOReportService service(
       platform::linux_::makeDriverSources(
-          std::get<platform::linux_::Configuration>(configuration).drivers),
-      statistics);
+          std::get<platform::linux_::Configuration>(configuration).drivers, errorLog),
+      errorLog, statistics);
   service.open();
   DriverPrinter printer(service, request, form, out);
   if (!request.group.empty() && !printer.hasChannels()) {

@@ -5,6 +5,7 @@
 
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
 #include "platform/linux/drivers/ConfiguredSources.h"
+#include "platform/linux/drivers/DriverSourceLog.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -95,16 +96,18 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
       store(storeOptions(configuration), {clock, statistics, backpressure}),
       analytics(store, clock),
       diagnosticReporters(snapshotOptions(configuration),
-                          {.statistics = statistics,
-                           .log = [this] { return log->keptLines(); },
+                          {.log = *log,
+                           .statistics = statistics,
+                           .keptLines = [this] { return log->keptLines(); },
                            .recorder = &snapshotRecorder}),
       files(configuration.storage.root, statistics),
-      preferenceReader(configuration.preferencesDirectory),
-      notify(configuration.notifyDirectory, preferenceReader, statistics),
+      preferenceReader(configuration.preferencesDirectory, *log),
+      notify(configuration.notifyDirectory, preferenceReader, *log, statistics),
       preferences(preferenceReader, statistics),
-      ioReport(makeDriverSources(configuration.drivers), statistics),
-      resultsFiles(configuration.storage.root, statistics),
-      traces(makeTraceServices(traceOptions(configuration, featureFlags), statistics)),
+      ioReport(makeDriverSources(configuration.drivers, driversCategory(*log)),
+               driversCategory(*log), statistics),
+      resultsFiles(configuration.storage.root, *log, statistics),
+      traces(makeTraceServices(traceOptions(configuration, featureFlags), *log, statistics)),
       dispatch(*log, statistics),
       nats(makeNats(configuration.link, {dispatch, statistics}, natsFailure)) {}
 

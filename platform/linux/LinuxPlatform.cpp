@@ -1,14 +1,12 @@
 #include "platform/linux/LinuxPlatform.h"
 
 #include <chrono>
-#include <cstdint>
 #include <string>
 
 #include <sysexits.h>
 
 #include "platform/linux/LinuxAdapters.h"
 #include "platform/linux/drivers/ConfiguredSources.h"
-#include "platform/log.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -17,13 +15,6 @@ namespace {
 constexpr std::chrono::seconds kJobsEndWithin{5};
 // How long it lets the queues of sessions run what they have before that.
 constexpr std::chrono::seconds kQueuesFinishWithin{5};
-
-LogCategory& mainCategory() {
-  static LogCategory& category = platform::log().createCategory("com.tarno.halvox", "main");
-  return category;
-}
-
-constexpr UnitLog kLog(mainCategory, "LinuxPlatform");
 
 const char* linkName(LinkBackend backend) {
   switch (backend) {
@@ -49,23 +40,12 @@ const char* busName(BusKind kind) {
   return "";
 }
 
-// Which counters to log: those above 0, or all.
-enum class Counters : std::uint8_t { kCounted, kAll };
-
-void logStatistics(const CounterStatisticsService& statistics, LogLevel level, Counters counters) {
-  for (const CounterReading& reading : statistics.snapshot()) {
-    if (reading.value == 0 && counters == Counters::kCounted) continue;
-    UnitLog::logTo(mainCategory(), "LinuxPlatform", level, "counted ", reading.piece, ", ",
-                   reading.name, ": ", reading.value);
-  }
-}
-
 }  // namespace
 
 LinuxPlatform::LinuxPlatform(const Configuration& configuration)
-    : adapters_(std::make_unique<LinuxAdapters>(configuration, [this] {
-        logStatistics(adapters_->statistics, LogLevel::kDefault, Counters::kAll);
-      })) {}
+    : adapters_(std::make_unique<LinuxAdapters>(
+          configuration, [this] { logStatistics(LogLevel::kDefault, Counters::kAll); })),
+      log_(adapters_->log->createCategory("com.tarno.halvox", "main"), "LinuxPlatform") {}
 
 LinuxPlatform::~LinuxPlatform() = default;
 
@@ -131,22 +111,29 @@ bool LinuxPlatform::close() {
   // After the link: the local one writes to the store until its last message.
   adapters_->store.close();
   // After everything that counts has ended: sums agree only then.
-  logStatistics(adapters_->statistics, LogLevel::kInfo, Counters::kCounted);
+  logStatistics(LogLevel::kInfo, Counters::kCounted);
   // Last, because everything above may log.
   adapters_->log->stop();
   return ended && linkEnded;
 }
 
+void LinuxPlatform::logStatistics(LogLevel level, Counters counters) const {
+  for (const CounterReading& reading : adapters_->statistics.snapshot()) {
+    if (reading.value == 0 && counters == Counters::kCounted) continue;
+    log_.log(level, "counted ", reading.piece, ", ", reading.name, ": ", reading.value);
+  }
+}
+
 void LinuxPlatform::logStart() const {
-  kLog.notice("serving ", adapters_->configuration.listener.socket.string(), ", bus ",
+  log_.notice("serving ", adapters_->configuration.listener.socket.string(), ", bus ",
               busName(adapters_->configuration.listener.bus), ", store ",
               adapters_->configuration.storage.directory.string());
-  kLog.notice("link: ", linkName(adapters_->configuration.link.backend));
-  kLog.notice("trace points: ",
+  log_.notice("link: ", linkName(adapters_->configuration.link.backend));
+  log_.notice("trace points: ",
               adapters_->kdebugFailure.empty() ? "LTTng" : "none, " + adapters_->kdebugFailure);
-  kLog.notice("traces: ", adapters_->traces->description());
+  log_.notice("traces: ", adapters_->traces->description());
   if (adapters_->configuration.drivers.alsa && !hasAlsaSource()) {
-    kLog.notice("drivers.alsa = true needs HALVOX_ALSA, which this build does not have; ALSA's ",
+    log_.notice("drivers.alsa = true needs HALVOX_ALSA, which this build does not have; ALSA's ",
                 "counters are not reported");
   }
 }

@@ -1,9 +1,11 @@
 #pragma once
 
+#include <cstdint>
 #include <memory>
 #include <optional>
 
 #include "platform/linux/StartFailure.h"
+#include "platform/object_log.h"
 #include "platform/services.h"
 
 namespace halvox::platform::linux_ {
@@ -33,9 +35,14 @@ class LinuxPlatform {
   [[nodiscard]] bool close();
 
  private:
+  // Which counters to log: those above 0, or all.
+  enum class Counters : std::uint8_t { kCounted, kAll };
+
   void logStart() const;
+  void logStatistics(LogLevel level, Counters counters) const;
 
   const std::unique_ptr<LinuxAdapters> adapters_;
+  const ObjectLog log_;
 };
 
 }  // namespace halvox::platform::linux_

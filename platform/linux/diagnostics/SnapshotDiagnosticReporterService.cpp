@@ -17,7 +17,7 @@
 #include "platform/linux/diagnostics/SnapshotCollector.h"
 #include "platform/linux/diagnostics/SnapshotDirectory.h"
 #include "platform/linux/store/StoreLog.h"
-#include "platform/log.h"
+#include "platform/object_log.h"
 #include "platform/services.h"
 
 namespace halvox::platform::linux_ {
@@ -26,13 +26,6 @@ namespace {
 constexpr int kNiceness = 10;
 constexpr const char* kBusy = "another snapshot is being taken";
 constexpr const char* kEnding = "the service is ending";
-
-LogCategory& diagnosticsCategory() {
-  static LogCategory& category = log().createCategory("com.tarno.halvox", "diagnostics");
-  return category;
-}
-
-constexpr UnitLog kLog(diagnosticsCategory, "SnapshotReporter");
 
 // The result of one request: a file, or the reason why there is none.
 struct Outcome {
@@ -59,6 +52,7 @@ class SnapshotDiagnosticReporterService::Worker {
   Worker(SnapshotOptions options, SnapshotPartners partners)
       : options_(std::move(options)),
         partners_(std::move(partners)),
+        log_(partners_.log.createCategory("com.tarno.halvox", "diagnostics"), "SnapshotReporter"),
         directory_(options_.storageDirectory),
         received_(partners_.statistics.counter("diagnostics", "received")),
         delivered_(partners_.statistics.counter("diagnostics", "delivered")),
@@ -90,6 +84,7 @@ class SnapshotDiagnosticReporterService::Worker {
 
   const SnapshotOptions options_;
   const SnapshotPartners partners_;
+  const ObjectLog log_;
   const SnapshotDirectory directory_;
   Counter& received_;
   Counter& delivered_;
@@ -183,7 +178,7 @@ void SnapshotDiagnosticReporterService::Worker::carryOut(const Work& work) {
 Outcome SnapshotDiagnosticReporterService::Worker::capture(const SnapshotRequest& request) {
   if (auto made = directory_.prepare(); !made) return {.failure = std::move(made).error().message};
   SnapshotSources sources{.paths = options_.paths,
-                          .log = partners_.log,
+                          .log = partners_.keptLines,
                           .state = {},
                           .stateWithin = options_.stateWithin,
                           .dumpWithin = options_.dumpWithin};
@@ -210,7 +205,7 @@ Dictionary SnapshotDiagnosticReporterService::Worker::conclude(const SnapshotReq
                                                                double seconds) {
   if (!outcome.failure.empty()) {
     (stop_.isRaised() ? ending_ : failed_).add();
-    if (errorLines_.tryPass()) kLog.error("cannot take a snapshot: ", outcome.failure);
+    if (errorLines_.tryPass()) log_.error("cannot take a snapshot: ", outcome.failure);
     return errorReply(outcome.failure);
   }
   // After the new one has its name: a capture that fails must not cost an old one.
@@ -220,7 +215,7 @@ Dictionary SnapshotDiagnosticReporterService::Worker::conclude(const SnapshotReq
     partners_.recorder->recordSnapshot(request.time, request.signature, outcome.path);
   }
   delivered_.add();
-  kLog.notice("snapshot taken: ", outcome.path.native(), ", ", outcome.size, " bytes");
+  log_.notice("snapshot taken: ", outcome.path.native(), ", ", outcome.size, " bytes");
   return {{"path", outcome.path.native()}, {"size_bytes", outcome.size}, {"seconds", seconds}};
 }
 

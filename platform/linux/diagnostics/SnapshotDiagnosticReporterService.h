@@ -11,6 +11,7 @@
 #include "platform/linux/diagnostics/SnapshotRecorder.h"
 #include "platform/linux/diagnostics/SystemFacts.h"
 #include "platform/linux/log/LogMemory.h"
+#include "platform/log.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {
@@ -28,9 +29,10 @@ struct SnapshotOptions {
 
 // The objects that a snapshot needs. All must outlive the service.
 struct SnapshotPartners {
+  LogService& log;
   StatisticsService& statistics;
-  std::function<LogMemory::Contents()> log{};  // empty: no log is kept in memory
-  SnapshotRecorder* recorder = nullptr;        // null: no records are kept
+  std::function<LogMemory::Contents()> keptLines{};  // empty: no log is kept in memory
+  SnapshotRecorder* recorder = nullptr;              // null: no records are kept
 };
 
 // Captures diagnostics into archives in the directory `snapshots` of the storage directory:

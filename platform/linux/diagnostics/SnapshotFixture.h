@@ -39,8 +39,10 @@ class SnapshotFixture : public ::testing::Test {
 
   void start() {
     service = std::make_unique<SnapshotDiagnosticReporterService>(
-        options,
-        SnapshotPartners{.statistics = platform.statistics, .log = log, .recorder = recorder});
+        options, SnapshotPartners{.log = platform.log,
+                                  .statistics = platform.statistics,
+                                  .keptLines = log,
+                                  .recorder = recorder});
   }
   // Requests a snapshot and returns the future response.
   [[nodiscard]] std::future<Dictionary> request(const std::string& process = "player");

@@ -8,14 +8,14 @@
 
 namespace halvox::platform::linux_ {
 
-std::vector<std::unique_ptr<DriverSource>> makeDriverSources(
-    const Configuration::Drivers& drivers) {
+std::vector<std::unique_ptr<DriverSource>> makeDriverSources(const Configuration::Drivers& drivers,
+                                                             LogCategory& log) {
   std::vector<std::unique_ptr<DriverSource>> sources;
 #ifdef HALVOX_ALSA
   if (drivers.alsa) sources.push_back(std::make_unique<AlsaSource>(drivers.alsaRoot));
 #endif
-  if (drivers.pipewire) sources.push_back(std::make_unique<PipeWireOnDemand>());
-  sources.push_back(std::make_unique<TextfileSource>(drivers.textfiles));
+  if (drivers.pipewire) sources.push_back(std::make_unique<PipeWireOnDemand>(log));
+  sources.push_back(std::make_unique<TextfileSource>(drivers.textfiles, log));
   return sources;
 }
 

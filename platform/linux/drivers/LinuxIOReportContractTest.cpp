@@ -8,6 +8,7 @@
 
 #include "platform/fake/FakePlatform.h"
 #include "platform/fake/contracts/IOReportContract.h"
+#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/LinuxIOReportService.h"
 #include "platform/linux/drivers/ReadingMaker.h"
 #include "platform/linux/drivers/testing/MadeReadings.h"
@@ -50,8 +51,9 @@ class LinuxIOReportHarness {
     std::vector<std::unique_ptr<DriverSource>> sources;
     sources.push_back(std::make_unique<testing::MadeSource>([this] { return read(); }));
     // Long enough that no reading is late on a busy machine.
-    service_ = std::make_unique<LinuxIOReportService>(std::move(sources), platform_.statistics,
-                                                      std::chrono::seconds(10));
+    service_ =
+        std::make_unique<LinuxIOReportService>(std::move(sources), driversCategory(platform_.log),
+                                               platform_.statistics, std::chrono::seconds(10));
     service_->open();
   }
 

@@ -125,11 +125,12 @@ const DriverSamples& samplesOf(const IOReportService::Samples& samples) {
 }  // namespace
 
 LinuxIOReportService::LinuxIOReportService(std::vector<std::unique_ptr<DriverSource>> sources,
-                                           StatisticsService& statistics,
+                                           LogCategory& log, StatisticsService& statistics,
                                            std::chrono::milliseconds longestWait)
     : longestWait_(longestWait) {
   for (auto& source : sources) {
-    readers_.push_back(std::make_unique<SourceReader>(std::move(source), statistics, longestWait));
+    readers_.push_back(
+        std::make_unique<SourceReader>(std::move(source), log, statistics, longestWait));
   }
 }
 

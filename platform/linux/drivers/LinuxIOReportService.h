@@ -7,6 +7,7 @@
 #include "platform/ioreport.h"
 #include "platform/linux/drivers/DriverSource.h"
 #include "platform/linux/drivers/SourceReader.h"
+#include "platform/log.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {
@@ -24,14 +25,14 @@ namespace halvox::platform::linux_ {
 // Owner: the platform. It owns the sources and their threads, which sleep while nobody asks.
 class LinuxIOReportService final : public IOReportService {
  public:
-  LinuxIOReportService(std::vector<std::unique_ptr<DriverSource>> sources,
+  // `log` and `statistics` must outlive the service.
+  LinuxIOReportService(std::vector<std::unique_ptr<DriverSource>> sources, LogCategory& log,
                        StatisticsService& statistics,
                        std::chrono::milliseconds longestWait = SourceReader::kLongestWait);
   ~LinuxIOReportService() override;
 
   // Starts the threads, which open all sources at once, and waits until each has opened or has
-  // taken too long. Call it once, before everything else, after the services are installed: sources
-  // log.
+  // taken too long. Call it once, before everything else.
   void open();
 
   Channels IOReportCopyChannelsInGroup(Name group, Name subGroup,

@@ -10,6 +10,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/testing/MadeReadings.h"
 #include "platform/linux/testing/Eventually.h"
 
@@ -52,8 +53,8 @@ class LinuxIOReportServiceTest : public ::testing::Test {
     std::vector<std::unique_ptr<DriverSource>> sources;
     sources.push_back(std::make_unique<MadeSource>(std::move(make)));
     if (other) sources.push_back(std::make_unique<MadeSource>(std::move(other)));
-    service_ = std::make_unique<LinuxIOReportService>(std::move(sources), platform_.statistics,
-                                                      longestWait_);
+    service_ = std::make_unique<LinuxIOReportService>(
+        std::move(sources), driversCategory(platform_.log), platform_.statistics, longestWait_);
     service_->open();
     return *service_;
   }
@@ -110,8 +111,8 @@ TEST_F(LinuxIOReportServiceTest, ASourceLearnsOfSamplesAndNotOfTheSearchForChann
   std::vector<std::unique_ptr<DriverSource>> sources;
   sources.push_back(std::make_unique<MadeSource>(
       [] { return makeReading({simpleChannel("Tx", "a")}, {1}); }, [&samples] { ++samples; }));
-  service_ = std::make_unique<LinuxIOReportService>(std::move(sources), platform_.statistics,
-                                                    longestWait_);
+  service_ = std::make_unique<LinuxIOReportService>(
+      std::move(sources), driversCategory(platform_.log), platform_.statistics, longestWait_);
   service_->open();
 
   const auto channels = find("Tx", std::nullopt);

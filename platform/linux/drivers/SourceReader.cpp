@@ -3,12 +3,8 @@
 #include <string>
 #include <utility>
 
-#include "platform/linux/drivers/DriverSourceLog.h"
-
 namespace halvox::platform::linux_ {
 namespace {
-
-constexpr UnitLog kLog(driversCategory, "SourceReader");
 
 std::string pieceOf(const DriverSource& source) {
   return "driver source " + std::string(source.name());
@@ -17,9 +13,10 @@ std::string pieceOf(const DriverSource& source) {
 }  // namespace
 
 // The counters balance: asked for = given + skipped.
-SourceReader::SourceReader(std::unique_ptr<DriverSource> source, StatisticsService& statistics,
-                           std::chrono::milliseconds longestWait)
+SourceReader::SourceReader(std::unique_ptr<DriverSource> source, LogCategory& log,
+                           StatisticsService& statistics, std::chrono::milliseconds longestWait)
     : source_(std::move(source)),
+      log_(log, "SourceReader"),
       longestWait_(longestWait),
       received_(statistics.counter(pieceOf(*source_), "readings asked for")),
       given_(statistics.counter(pieceOf(*source_), "readings given")),
@@ -43,7 +40,7 @@ void SourceReader::startOpening() {
 void SourceReader::waitUntilOpen() {
   bool isFirstLate = false;
   if (receive(opening_, isFirstLate) != nullptr) return;
-  kLog.error("driver source ", source_->name(), " did not open within ", opening_.wait.count(),
+  log_.error("driver source ", source_->name(), " did not open within ", opening_.wait.count(),
              " ms; its counters are not reported until the service restarts");
 }
 
@@ -62,7 +59,7 @@ std::shared_ptr<const Reading> SourceReader::take(const Asked& asked) {
   bool isFirstLate = false;
   ReadingPointer reading = receive(asked, isFirstLate);
   if (isFirstLate) {
-    kLog.error("driver source ", source_->name(), " did not answer within ", asked.wait.count(),
+    log_.error("driver source ", source_->name(), " did not answer within ", asked.wait.count(),
                " ms; its counters are skipped until it answers in time");
   }
   return reading;

@@ -7,6 +7,7 @@
 
 #include "platform/linux/base/Mutex.h"
 #include "platform/linux/drivers/DriverSource.h"
+#include "platform/object_log.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {
@@ -32,9 +33,10 @@ class SourceReader {
   // Once, when the service starts. What is missed then is missing until the next start.
   static constexpr std::chrono::milliseconds kLongestOpening{1000};
 
-  // `longestWait` is the time that a reading may take.
-  SourceReader(std::unique_ptr<DriverSource> source, StatisticsService& statistics,
-               std::chrono::milliseconds longestWait = kLongestWait);
+  // `log` and `statistics` must outlive the reader. `longestWait` is the time that a reading may
+  // take.
+  SourceReader(std::unique_ptr<DriverSource> source, LogCategory& log,
+               StatisticsService& statistics, std::chrono::milliseconds longestWait = kLongestWait);
   SourceReader(const SourceReader&) = delete;
   SourceReader& operator=(const SourceReader&) = delete;
   ~SourceReader();
@@ -73,6 +75,7 @@ class SourceReader {
       HALVOX_REQUIRES(mutex_);
 
   const std::unique_ptr<DriverSource> source_;
+  const ObjectLog log_;
   const std::chrono::milliseconds longestWait_;
   Counter& received_;
   Counter& given_;

@@ -22,8 +22,6 @@ namespace {
 
 using namespace std::chrono_literals;
 
-constexpr UnitLog kLog(settingsCategory, "InotifyNotifyService");
-
 // A change is posted after kQuietTime without another, but not later than kLongestDelay after the
 // first: steady changes must not delay a post for ever.
 constexpr auto kQuietTime = 50ms;
@@ -51,9 +49,10 @@ void drain(int descriptor) {
 }  // namespace
 
 InotifyNotifyService::InotifyNotifyService(const std::filesystem::path& directory,
-                                           const PreferenceReader& preferences,
+                                           const PreferenceReader& preferences, LogService& log,
                                            StatisticsService& statistics)
-    : directories_{directory, preferences.directory() / kPreferenceUser},
+    : log_(settingsLog(log, "InotifyNotifyService")),
+      directories_{directory, preferences.directory() / kPreferenceUser},
       settings_(directory, preferences, statistics),
       delivered_(statistics.counter("notifications", "handlers called")) {}
 
@@ -62,7 +61,7 @@ NotifyStatus InotifyNotifyService::notify_register_dispatch(std::string_view nam
                                                             std::shared_ptr<DispatchQueue> queue,
                                                             Handler handler) {
   if (!isUsableName(name)) {
-    kLog.error("cannot register for the notification ", shownName(name),
+    log_.error("cannot register for the notification ", shownName(name),
                ": expected a name that a file can have; it will never be posted");
     return kNotifyInvalidName;
   }
@@ -152,12 +151,12 @@ void InotifyNotifyService::arm() {
   if (error) {
     retryAt_ = Clock::now() + kRetryTime;
     if (!wasFailing) {
-      kLog.error("cannot watch the directories of the settings: ", error.message(),
+      log_.error("cannot watch the directories of the settings: ", error.message(),
                  "; changes go unnoticed until that succeeds; trying again every ",
                  kRetryTime.count(), " s");
     }
   } else if (wasFailing) {
-    kLog.notice("watching the directories of the settings again");
+    log_.notice("watching the directories of the settings again");
   }
   logNotifyDirectory();
   // Whatever changed while nothing was watched, or whose events were lost, is found by comparing
@@ -186,11 +185,11 @@ void InotifyNotifyService::logNotifyDirectory() {
   const bool isThere = watch_.isThere(kNotifyDirectory);
   if (isThere == std::exchange(hasNotifyDirectory_, isThere)) return;
   if (!isThere) {
-    kLog.notice("the notify directory ", watch_.path(kNotifyDirectory).native(),
+    log_.notice("the notify directory ", watch_.path(kNotifyDirectory).native(),
                 " was deleted; waiting until it exists again");
     notifyDirectoryWasGone_ = true;
   } else if (notifyDirectoryWasGone_) {
-    kLog.notice("the notify directory ", watch_.path(kNotifyDirectory).native(),
+    log_.notice("the notify directory ", watch_.path(kNotifyDirectory).native(),
                 " exists again; watching it");
   }
 }
@@ -234,7 +233,7 @@ void InotifyNotifyService::deliver() {
   const std::set<std::string> posted = settings_.settle();
   for (const Registration& one : registrations_) {
     if (!posted.contains(one.name)) continue;
-    kLog.debug("posting ", one.name);
+    log_.debug("posting ", one.name);
     delivered_.add();
     one.queue->async(JobWeight::kMayBlock,
                      [handler = one.handler, token = one.token] { (*handler)(token); });

@@ -14,6 +14,7 @@
 #include "platform/linux/settings/DirectoryWatch.h"
 #include "platform/linux/settings/WatchedSettings.h"
 #include "platform/notify.h"
+#include "platform/object_log.h"
 
 namespace halvox::platform::linux_ {
 
@@ -36,9 +37,9 @@ inline constexpr NotifyStatus kNotifyFailed = 1'000'000;
 // Owned by the platform. Any thread may call. Handlers run on the queue of their registration.
 class InotifyNotifyService final : public NotifyService {
  public:
-  // Does not own the reader and the statistics, which must outlive it.
+  // Does not own the reader, the log and the statistics, which must outlive it.
   InotifyNotifyService(const std::filesystem::path& directory, const PreferenceReader& preferences,
-                       StatisticsService& statistics);
+                       LogService& log, StatisticsService& statistics);
   InotifyNotifyService(const InotifyNotifyService&) = delete;
   InotifyNotifyService& operator=(const InotifyNotifyService&) = delete;
   ~InotifyNotifyService() override { stop(); }
@@ -75,6 +76,7 @@ class InotifyNotifyService final : public NotifyService {
   void deliver();
   [[nodiscard]] std::optional<Clock::time_point> nextWork() const;
 
+  const ObjectLog log_;
   // The directories that are always watched. In the list for `watch_` the directories of `linked_`
   // and then those of `notifyLinks_` follow.
   const std::vector<std::filesystem::path> directories_;

@@ -59,8 +59,8 @@ class InotifyNotifyServiceTest : public SettingsFixture {
   std::map<NotifyToken, int> posts_;
   NotifyToken sentinel_ = 0;
   NotifyToken name_ = 0;
-  PreferenceReader reader_{preferences()};
-  InotifyNotifyService service_{notify(), reader_, platform_.statistics};
+  PreferenceReader reader_{preferences(), platform_.log};
+  InotifyNotifyService service_{notify(), reader_, platform_.log, platform_.statistics};
 };
 
 TEST_F(InotifyNotifyServiceTest, EveryRegistrationHasATokenOfItsOwn) {

@@ -36,8 +36,8 @@ class InotifyHarness {
   FakePlatform platform_;
   std::shared_ptr<DispatchQueue> queue_ = platform_.dispatch.createSerialQueue(
       "test", QualityOfService::kUtility, QueueThreading::kShared);
-  linux_::PreferenceReader reader_{scratch_.path() / "preferences"};
-  linux_::InotifyNotifyService service_{directory(), reader_, platform_.statistics};
+  linux_::PreferenceReader reader_{scratch_.path() / "preferences", platform_.log};
+  linux_::InotifyNotifyService service_{directory(), reader_, platform_.log, platform_.statistics};
 };
 
 }  // namespace

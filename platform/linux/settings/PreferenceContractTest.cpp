@@ -44,7 +44,7 @@ class TomlHarness {
   const linux_::ScratchDirectory scratch_;
   std::map<std::string, std::map<std::string, std::string>> domains_;
   FakePlatform platform_;
-  linux_::PreferenceReader reader_{scratch_.path() / "preferences"};
+  linux_::PreferenceReader reader_{scratch_.path() / "preferences", platform_.log};
   linux_::TomlPreferenceService service_{reader_, platform_.statistics};
 };
 

@@ -12,7 +12,6 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(settingsCategory, "PreferenceReader");
 // With more entries, all are forgotten, and a mistake may be logged a second time.
 constexpr std::size_t kMostLogged = 64;
 
@@ -25,6 +24,9 @@ std::string stateOf(const std::filesystem::path& file) {
 }
 
 }  // namespace
+
+PreferenceReader::PreferenceReader(std::filesystem::path directory, LogService& log)
+    : directory_(std::move(directory)), log_(settingsLog(log, "PreferenceReader")) {}
 
 std::optional<Dictionary> PreferenceReader::read(std::string_view user,
                                                  std::string_view domain) const {
@@ -54,7 +56,7 @@ void PreferenceReader::logOnce(const std::string& subject, const std::string& st
     if (logged_.size() >= kMostLogged) logged_.clear();
     logged_.insert_or_assign(subject, state);
   }
-  kLog.error("", line);
+  log_.error("", line);
 }
 
 void PreferenceReader::logFixed(const std::string& file) const {
@@ -62,7 +64,7 @@ void PreferenceReader::logFixed(const std::string& file) const {
     const MutexLock held(mutex_);
     if (logged_.erase(file) == 0) return;
   }
-  kLog.notice("", file, ": the preferences can be read again; using their values");
+  log_.notice("", file, ": the preferences can be read again; using their values");
 }
 
 }  // namespace halvox::platform::linux_

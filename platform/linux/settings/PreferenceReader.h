@@ -7,6 +7,7 @@
 #include <string_view>
 
 #include "platform/linux/base/Mutex.h"
+#include "platform/object_log.h"
 #include "platform/value.h"
 
 namespace halvox::platform::linux_ {
@@ -18,7 +19,8 @@ namespace halvox::platform::linux_ {
 // Any thread may call. Reads the file on each call, so it blocks on the disk.
 class PreferenceReader {
  public:
-  explicit PreferenceReader(std::filesystem::path directory) : directory_(std::move(directory)) {}
+  // `log` must outlive the reader.
+  PreferenceReader(std::filesystem::path directory, LogService& log);
   PreferenceReader(const PreferenceReader&) = delete;
   PreferenceReader& operator=(const PreferenceReader&) = delete;
 
@@ -34,6 +36,7 @@ class PreferenceReader {
   void logFixed(const std::string& file) const HALVOX_EXCLUDES(mutex_);
 
   const std::filesystem::path directory_;
+  const ObjectLog log_;
   mutable Mutex mutex_;
   // What was logged last about each bad file or name. Bounded, because clients choose names.
   mutable std::map<std::string, std::string, std::less<>> logged_ HALVOX_GUARDED_BY(mutex_);

@@ -1,14 +1,14 @@
 #pragma once
 
-#include "platform/log.h"
-#include "platform/services.h"
+#include <string_view>
+
+#include "platform/object_log.h"
 
 namespace halvox::platform::linux_ {
 
-// The log category of everything in this folder. The first call makes it; any thread may call.
-inline LogCategory& settingsCategory() {
-  static LogCategory& category = platform::log().createCategory("com.tarno.halvox", "settings");
-  return category;
+// The log of one object of this folder, in the category that all of them share.
+inline ObjectLog settingsLog(LogService& log, std::string_view unit) {
+  return {log.createCategory("com.tarno.halvox", "settings"), unit};
 }
 
 }  // namespace halvox::platform::linux_

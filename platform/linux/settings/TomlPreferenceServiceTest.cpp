@@ -21,7 +21,7 @@ class TomlPreferenceServiceTest : public SettingsFixture {
   }
   void store(std::string_view text) { write(domainFile("domain"), text); }
 
-  PreferenceReader reader_{preferences()};
+  PreferenceReader reader_{preferences(), platform_.log};
   TomlPreferenceService service_{reader_, platform_.statistics};
 };
 

@@ -45,7 +45,7 @@ class JsonResultsFileHarness {
   linux_::CounterStatisticsService statistics_;
   const linux_::ScratchDirectory directory_;
   const std::filesystem::path root_ = directory_.path() / "root";
-  linux_::JsonResultsFileService service_{root_, statistics_};
+  linux_::JsonResultsFileService service_{root_, platform_.log, statistics_};
 };
 
 }  // namespace

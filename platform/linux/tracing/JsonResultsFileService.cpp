@@ -20,8 +20,6 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(tracingCategory, "JsonResultsFileService");
-
 using Text = rapidjson::StringBuffer;
 using TextWriter = rapidjson::Writer<Text>;
 
@@ -107,9 +105,10 @@ class ResultsFile final : public Sswriter {
 
 }  // namespace
 
-JsonResultsFileService::JsonResultsFileService(std::filesystem::path root,
+JsonResultsFileService::JsonResultsFileService(std::filesystem::path root, LogService& log,
                                                StatisticsService& statistics)
     : root_(std::move(root)),
+      log_(tracingLog(log, "JsonResultsFileService")),
       begun_(statistics.counter("results files", "files begun")),
       written_(statistics.counter("results files", "files written")),
       failed_(statistics.counter("results files", "files that failed")),
@@ -125,7 +124,7 @@ ResultsFileService::Writer JsonResultsFileService::sswriter_open(std::string_vie
   const auto error = file->begin({root_, directory}, std::move(name));
   if (!error.has_value()) return file;
   failed_.add();
-  kLog.error("cannot write a results file: ", error->description, "; its values are lost");
+  log_.error("cannot write a results file: ", error->description, "; its values are lost");
   return nullptr;
 }
 
@@ -140,7 +139,7 @@ void JsonResultsFileService::sswriter_close(Writer writer) {
   const auto error = dynamic_cast<ResultsFile&>(*writer).finish();
   (error.has_value() ? failed_ : written_).add();
   if (error.has_value()) {
-    kLog.error("cannot write a results file: ", error->description, "; its values are lost");
+    log_.error("cannot write a results file: ", error->description, "; its values are lost");
   }
 }
 

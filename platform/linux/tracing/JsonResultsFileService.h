@@ -2,6 +2,7 @@
 
 #include <filesystem>
 
+#include "platform/object_log.h"
 #include "platform/results_file.h"
 #include "platform/statistics.h"
 
@@ -22,8 +23,9 @@ namespace halvox::platform::linux_ {
 // logged and counted; an older file of that name stays.
 class JsonResultsFileService final : public ResultsFileService {
  public:
-  // The statistics must outlive the service, and the service its writers.
-  JsonResultsFileService(std::filesystem::path root, StatisticsService& statistics);
+  // The log and the statistics must outlive the service, and the service its writers.
+  JsonResultsFileService(std::filesystem::path root, LogService& log,
+                         StatisticsService& statistics);
 
   Writer sswriter_open(std::string_view path, std::string_view productName, std::uint32_t version,
                        std::uint32_t flags) override;
@@ -33,6 +35,7 @@ class JsonResultsFileService final : public ResultsFileService {
 
  private:
   const std::filesystem::path root_;
+  const ObjectLog log_;
   Counter& begun_;
   Counter& written_;
   Counter& failed_;

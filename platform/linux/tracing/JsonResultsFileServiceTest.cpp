@@ -42,7 +42,7 @@ class JsonResultsFileServiceTest : public testing::Test {
   const ScratchDirectory directory_;
   const std::filesystem::path scratch_ = directory_.path();
   const std::filesystem::path root_ = scratch_ / "root";
-  JsonResultsFileService service_{root_, platform_.statistics};
+  JsonResultsFileService service_{root_, platform_.log, platform_.statistics};
 };
 
 TEST_F(JsonResultsFileServiceTest, FileHasProductVersionUnitAndValuesByName) {

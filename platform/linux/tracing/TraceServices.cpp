@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options,
+std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options, LogService& log,
                                                  StatisticsService& statistics) {
   const std::filesystem::path directory = options.storageDirectory / "traces";
   // A recording of an earlier run keeps filling the disk until its session is destroyed. Only the
@@ -16,11 +16,11 @@ std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options,
   if (options.tracing == Tracing::kDisabled && !hasTraceLeftovers(directory)) {
     return makeNoTraceServices("features.Acoustat.Tracing is not true");
   }
-  auto loaded = loadEntryPoint<decltype(halvox_tracing_lttng_1)>(kTracingModule);
+  auto loaded = loadEntryPoint<decltype(halvox_tracing_lttng_2)>(kTracingModule);
   if (!loaded) {
     return makeNoTraceServices("features.Acoustat.Tracing = true needs " + loaded.error().message);
   }
-  return std::unique_ptr<TraceServices>((*loaded)(directory, statistics));
+  return std::unique_ptr<TraceServices>((*loaded)(directory, log, statistics));
 }
 
 bool hasTraceLeftovers(const std::filesystem::path& tracesDirectory) {

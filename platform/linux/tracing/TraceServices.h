@@ -6,6 +6,7 @@
 #include <string>
 
 #include "platform/ktrace.h"
+#include "platform/log.h"
 #include "platform/performance_trace.h"
 #include "platform/statistics.h"
 
@@ -51,8 +52,9 @@ struct TraceOptions {
 // libraries of LTTng's control and of babeltrace2. Returns services whose traces cannot be started,
 // and whose description says why, when tracing is disabled or the module cannot be loaded. The
 // module is also loaded when an earlier service did not remove a recording, because only the module
-// can. The statistics must outlive the services.
+// can. The log and the statistics must outlive the services.
 [[nodiscard]] std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options,
+                                                               LogService& log,
                                                                StatisticsService& statistics);
 
 // Whether a service that ended in the middle of a trace left something in that directory.

@@ -18,8 +18,9 @@ TEST(TraceServicesTest, WithoutTheSwitchNoTracerIsLoaded) {
   FakePlatform platform;
   const ScratchDirectory storage;
 
-  const auto traces = makeTraceServices(
-      {.storageDirectory = storage.path(), .tracing = Tracing::kDisabled}, platform.statistics);
+  const auto traces =
+      makeTraceServices({.storageDirectory = storage.path(), .tracing = Tracing::kDisabled},
+                        platform.log, platform.statistics);
 
   EXPECT_EQ(traces->description(), "none, features.Acoustat.Tracing is not true");
 }

@@ -1,10 +1,14 @@
 #pragma once
 
-#include "platform/log.h"
+#include <string_view>
+
+#include "platform/object_log.h"
 
 namespace halvox::platform::linux_ {
 
-// The log category of the adapters in this folder. The first call makes it. Any thread may call.
-LogCategory& tracingCategory();
+// The log of one object of this folder, in the category that all of them share.
+inline ObjectLog tracingLog(LogService& log, std::string_view unit) {
+  return {log.createCategory("com.tarno.halvox", "tracing"), unit};
+}
 
 }  // namespace halvox::platform::linux_

@@ -11,14 +11,11 @@
 #include <pipewire/impl-module.h>
 
 #include "platform/linux/base/ErrnoText.h"
-#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/pipewire/ObjectBinding.h"
 #include "platform/linux/pipewire/ProfileDecoder.h"
 
 namespace halvox::platform::linux_ {
 namespace {
-
-constexpr UnitLog kLog(driversCategory, "GraphFollower");
 
 // The server has announced all objects before the first answer, and sent their states before the
 // second.
@@ -51,7 +48,7 @@ std::optional<NodeState> nodeState(pw_node_state state) {
 }
 
 // Only what is needed: no user configuration, no real-time scheduling, no bus.
-pipewire::UniqueContext makeContext(pw_loop* loop) {
+pipewire::UniqueContext makeContext(pw_loop* loop, const ObjectLog& log) {
   // The library warns about the missing parts. They are missing on purpose.
   if (std::getenv("PIPEWIRE_DEBUG") == nullptr) pw_log_set_level(SPA_LOG_LEVEL_ERROR);
   pipewire::UniqueContext context(
@@ -62,7 +59,7 @@ pipewire::UniqueContext makeContext(pw_loop* loop) {
     return nullptr;
   }
   if (!pipewire::loadProfilerModule(context.get())) {
-    kLog.error("PipeWire's profiler module is not installed; cycles and xruns are not counted");
+    log.error("PipeWire's profiler module is not installed; cycles and xruns are not counted");
   }
   return context;
 }
@@ -94,15 +91,16 @@ class GraphFollower::Node {
   pipewire::ObjectBinding binding_;
 };
 
-GraphFollower::GraphFollower(pw_loop* loop, SharedGraph& graph)
+GraphFollower::GraphFollower(pw_loop* loop, SharedGraph& graph, LogCategory& log)
     : loop_(loop),
       graph_(graph),
+      log_(log, "GraphFollower"),
       timer_(pw_loop_add_timer(loop, &GraphFollower::onTimer, this)),
       watch_(loop, [this] { serverAppeared(); }),
-      context_(timer_ != nullptr ? makeContext(loop) : nullptr),
+      context_(timer_ != nullptr ? makeContext(loop, log_) : nullptr),
       server_(context_.get(), *this) {
   if (context_ == nullptr) {
-    kLog.error("cannot set up PipeWire's library: ", errnoText(errno),
+    log_.error("cannot set up PipeWire's library: ", errnoText(errno),
                "; PipeWire counters are disabled until the service restarts");
   }
 }
@@ -164,7 +162,7 @@ void GraphFollower::connect() {
     return;
   }
   if (!std::exchange(isMissingLogged_, true)) {
-    kLog.info("cannot connect to PipeWire: ", errnoText(errno),
+    log_.info("cannot connect to PipeWire: ", errnoText(errno),
               "; waiting for it while sessions run");
   }
   settle();
@@ -233,14 +231,14 @@ void GraphFollower::onTimer(void* data, std::uint64_t /*expirations*/) {
 void GraphFollower::onServerReached(const pw_core_info& server) {
   isMissingLogged_ = false;
   attempts_ = kAttempts;
-  kLog.notice("following PipeWire ", server.version, " (", server.name, ")");
+  log_.notice("following PipeWire ", server.version, " (", server.name, ")");
   const MutexLock lock(graph_.mutex);
   graph_.statistics.serverReached();
 }
 
 void GraphFollower::onServerLost() {
   isLost_ = true;
-  kLog.notice("the connection to PipeWire ended; waiting for the server while sessions run");
+  log_.notice("the connection to PipeWire ended; waiting for the server while sessions run");
   // Lets the timer disconnect: the library does not allow that inside this call.
   proceedAfter(Clock::duration::zero());
 }
@@ -272,7 +270,7 @@ void GraphFollower::onGlobalRemoved(GlobalID id) {
 }
 
 void GraphFollower::onRefused(GlobalID id, const char* message) {
-  kLog.info("PipeWire refused a request: ", message, " (object ", id, "); continuing without it");
+  log_.info("PipeWire refused a request: ", message, " (object ", id, "); continuing without it");
 }
 
 void GraphFollower::onAnswered() {

@@ -13,6 +13,7 @@
 #include "platform/linux/pipewire/Handles.h"
 #include "platform/linux/pipewire/ProfilerBinding.h"
 #include "platform/linux/pipewire/ServerConnection.h"
+#include "platform/object_log.h"
 
 namespace halvox::platform::linux_ {
 
@@ -26,7 +27,8 @@ namespace halvox::platform::linux_ {
 // it is looked for.
 class GraphFollower final : private pipewire::ServerListener {
  public:
-  GraphFollower(pw_loop* loop, SharedGraph& graph);
+  // All three must outlive it.
+  GraphFollower(pw_loop* loop, SharedGraph& graph, LogCategory& log);
   ~GraphFollower() override;
 
   // False if the library cannot be used at all, which is logged.
@@ -64,6 +66,7 @@ class GraphFollower final : private pipewire::ServerListener {
 
   pw_loop* const loop_;
   SharedGraph& graph_;
+  const ObjectLog log_;
   spa_source* timer_ = nullptr;
   ServerWatch watch_;
   int attempts_ = 0;  // remaining attempts to connect

@@ -5,15 +5,13 @@
 #include <pipewire/pipewire.h>
 
 #include "platform/linux/base/Mutex.h"
-#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/ReadingMaker.h"
 #include "platform/linux/drivers/pipewire/GraphFollower.h"
 #include "platform/linux/drivers/pipewire/SharedGraph.h"
+#include "platform/object_log.h"
 
 namespace halvox::platform::linux_ {
 namespace {
-
-constexpr UnitLog kLog(driversCategory, "PipeWireDriverSource");
 
 // Wakes the loop from any thread; does nothing after the loop has been destroyed. Shared by the
 // source and the leases, because a session may hold its snapshot longer than the source exists.
@@ -52,7 +50,10 @@ class Lease {
 
 class PipeWireDriverSource::Impl {
  public:
-  explicit Impl(Options options) : options_(options) { pw_init(nullptr, nullptr); }
+  Impl(LogCategory& log, Options options)
+      : category_(log), log_(log, "PipeWireDriverSource"), options_(options) {
+    pw_init(nullptr, nullptr);
+  }
   ~Impl() {
     // First: leases may outlive this and must not ring a loop that ends.
     bell_->remove();
@@ -68,7 +69,7 @@ class PipeWireDriverSource::Impl {
 
   void open() {
     if (!start()) {
-      kLog.error(
+      log_.error(
           "cannot start the PipeWire thread; PipeWire counters are disabled until the service "
           "restarts");
       return;
@@ -110,7 +111,7 @@ class PipeWireDriverSource::Impl {
     loop_ = pw_thread_loop_new("halvox-pipewire", nullptr);
     if (loop_ == nullptr) return false;
     pw_loop* const loop = pw_thread_loop_get_loop(loop_);
-    connection_ = std::make_unique<GraphFollower>(loop, graph_);
+    connection_ = std::make_unique<GraphFollower>(loop, graph_, category_);
     if (!connection_->isUsable()) return false;
     event_ = pw_loop_add_event(loop, &Impl::onRing, this);
     if (event_ == nullptr || pw_thread_loop_start(loop_) != 0) return false;
@@ -122,6 +123,8 @@ class PipeWireDriverSource::Impl {
     static_cast<Impl*>(data)->connection_->update();
   }
 
+  LogCategory& category_;
+  const ObjectLog log_;
   const Options options_;
   const std::shared_ptr<Bell> bell_ = std::make_shared<Bell>();
   SharedGraph graph_;
@@ -131,8 +134,8 @@ class PipeWireDriverSource::Impl {
   std::unique_ptr<GraphFollower> connection_;
 };
 
-PipeWireDriverSource::PipeWireDriverSource(Options options)
-    : impl_(std::make_unique<Impl>(options)) {}
+PipeWireDriverSource::PipeWireDriverSource(LogCategory& log, Options options)
+    : impl_(std::make_unique<Impl>(log, options)) {}
 PipeWireDriverSource::~PipeWireDriverSource() = default;
 void PipeWireDriverSource::open() { impl_->open(); }
 std::shared_ptr<const Reading> PipeWireDriverSource::read() { return impl_->read(); }

@@ -4,6 +4,7 @@
 #include <memory>
 
 #include "platform/linux/drivers/DriverSource.h"
+#include "platform/log.h"
 
 namespace halvox::platform::linux_ {
 
@@ -26,8 +27,9 @@ class PipeWireDriverSource final : public DriverSource {
     std::chrono::milliseconds longestOpening{800};
   };
 
-  PipeWireDriverSource() : PipeWireDriverSource(Options()) {}
-  explicit PipeWireDriverSource(Options options);
+  // `log` must outlive the source.
+  explicit PipeWireDriverSource(LogCategory& log) : PipeWireDriverSource(log, Options()) {}
+  PipeWireDriverSource(LogCategory& log, Options options);
   ~PipeWireDriverSource() override;
 
   [[nodiscard]] std::string_view name() const override { return "pipewire"; }

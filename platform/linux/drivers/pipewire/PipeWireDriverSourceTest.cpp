@@ -10,6 +10,7 @@
 #include <stdlib.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/testing/MadeReadings.h"
 #include "platform/linux/pipewire/testing/PrivatePipeWire.h"
 #include "platform/linux/testing/Eventually.h"
@@ -63,11 +64,11 @@ constexpr std::string_view kCycles = "demo-speakers/Speaker/PipeWire/cycles";
 
 // There is no server.
 TEST(PipeWireDriverSourceAloneTest, OnlyTheConnectionsAreThereAndOpeningDoesNotWait) {
-  const FakePlatform platform;
+  FakePlatform platform;
   const ScratchDirectory directory;
   setenv("XDG_RUNTIME_DIR", directory.path().c_str(), 1);
   // If it waited, the test would take this long.
-  PipeWireDriverSource source({.longestOpening = 1h});
+  PipeWireDriverSource source(driversCategory(platform.log), {.longestOpening = 1h});
   const auto start = Clock::now();
 
   source.open();
@@ -80,10 +81,10 @@ TEST(PipeWireDriverSourceAloneTest, OnlyTheConnectionsAreThereAndOpeningDoesNotW
 }
 
 TEST(PipeWireDriverSourceAloneTest, AReadingMayOutliveTheSource) {
-  const FakePlatform platform;
+  FakePlatform platform;
   std::shared_ptr<const Reading> reading;
   {
-    PipeWireDriverSource source;
+    PipeWireDriverSource source(driversCategory(platform.log));
     source.open();
     reading = source.read();
   }
@@ -99,7 +100,7 @@ class PipeWireDriverSourceTest : public ::testing::Test {
     }
     audio = std::make_unique<PrivatePipeWire>();
     ASSERT_TRUE(audio->isReady());
-    source = std::make_unique<PipeWireDriverSource>();
+    source = std::make_unique<PipeWireDriverSource>(driversCategory(platform.log));
     source->open();
   }
   void TearDown() override { source.reset(); }
@@ -180,7 +181,7 @@ TEST_F(PipeWireDriverSourceTest, AServerThatAppearsWhileAReadingIsHeldIsFound) {
   const auto socket = audio->directory() / "run" / "pipewire-0";
   const auto elsewhere = audio->directory() / "socket";
   std::filesystem::rename(socket, elsewhere);
-  PipeWireDriverSource early;
+  PipeWireDriverSource early(driversCategory(platform.log));
   early.open();
   const auto held = early.read();
   ASSERT_EQ(valueOf(held, kConnections), 0);

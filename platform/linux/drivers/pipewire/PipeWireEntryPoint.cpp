@@ -6,9 +6,10 @@
 
 namespace halvox::platform::linux_ {
 
-DriverSource* halvox_drivers_pipewire_1(std::chrono::milliseconds longestOpening) {
+DriverSource* halvox_drivers_pipewire_2(std::chrono::milliseconds longestOpening,
+                                        LogCategory& log) {
   return std::make_unique<PipeWireDriverSource>(
-             PipeWireDriverSource::Options{.longestOpening = longestOpening})
+             log, PipeWireDriverSource::Options{.longestOpening = longestOpening})
       .release();
 }
 

@@ -5,7 +5,6 @@
 #include <string>
 #include <system_error>
 
-#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/pipewire/NodeChannel.h"
 #include "platform/linux/drivers/pipewire/PipeWireEntryPoint.h"
 #include "platform/linux/drivers/pipewire/ServerSocket.h"
@@ -13,7 +12,6 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(driversCategory, "PipeWireOnDemand");
 constexpr std::array<std::uint64_t, 1> kNone{0};
 // What a server that is there may take to name its objects. More would make the source late.
 constexpr std::chrono::milliseconds kLongestOpening{800};
@@ -31,8 +29,10 @@ struct PipeWireOnDemand::Lease {
   std::shared_ptr<const Reading> ofLoaded;
 };
 
-PipeWireOnDemand::PipeWireOnDemand()
-    : connections_{makeChannel(describeNodeChannel(kSinkGroup, "pipewire", "connections")),
+PipeWireOnDemand::PipeWireOnDemand(LogCategory& log)
+    : category_(log),
+      log_(log, "PipeWireOnDemand"),
+      connections_{makeChannel(describeNodeChannel(kSinkGroup, "pipewire", "connections")),
                    makeChannel(describeNodeChannel(kSourceGroup, "pipewire", "connections"))} {}
 
 void PipeWireOnDemand::open() {
@@ -61,14 +61,14 @@ void PipeWireOnDemand::sampled() {
 }
 
 void PipeWireOnDemand::load(std::chrono::milliseconds longestOpening) {
-  const auto loaded = loadEntryPoint<decltype(halvox_drivers_pipewire_1)>(kPipeWireModule);
+  const auto loaded = loadEntryPoint<decltype(halvox_drivers_pipewire_2)>(kPipeWireModule);
   if (!loaded) {
     isDisabled_ = true;
-    kLog.error("drivers.pipewire = true needs ", loaded.error().message,
+    log_.error("drivers.pipewire = true needs ", loaded.error().message,
                "; PipeWire's counters are disabled until the next start");
     return;
   }
-  source_.reset((*loaded)(longestOpening));
+  source_.reset((*loaded)(longestOpening, category_));
   source_->open();
 }
 

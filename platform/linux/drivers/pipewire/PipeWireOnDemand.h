@@ -6,6 +6,7 @@
 
 #include "platform/linux/drivers/DriverSource.h"
 #include "platform/linux/drivers/ReadingMaker.h"
+#include "platform/object_log.h"
 
 namespace halvox::platform::linux_ {
 
@@ -21,7 +22,8 @@ namespace halvox::platform::linux_ {
 // server. Belongs to the thread of its reader.
 class PipeWireOnDemand final : public DriverSource {
  public:
-  PipeWireOnDemand();
+  // `log` must outlive the source.
+  explicit PipeWireOnDemand(LogCategory& log);
 
   [[nodiscard]] std::string_view name() const override { return "pipewire"; }
   void open() override;
@@ -33,6 +35,8 @@ class PipeWireOnDemand final : public DriverSource {
 
   void load(std::chrono::milliseconds longestOpening);
 
+  LogCategory& category_;  // of the loaded source too
+  const ObjectLog log_;
   std::array<ChannelList::Channel, 2> connections_;
   bool isDisabled_ = false;
   std::unique_ptr<DriverSource> source_;  // once loaded

@@ -9,6 +9,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/testing/MadeReadings.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
@@ -27,10 +28,10 @@ std::string maps() {
 
 // The module stays loaded once a test has loaded it, so the steps of a life are one test.
 TEST(PipeWireOnDemandTest, TheModuleIsLoadedForTheFirstSampleAndNotToFindChannels) {
-  const FakePlatform platform;
+  FakePlatform platform;
   const ScratchDirectory directory;  // without a server's socket
   ::setenv("PIPEWIRE_REMOTE", (directory.path() / "no-server").c_str(), 1);
-  PipeWireOnDemand source;
+  PipeWireOnDemand source(driversCategory(platform.log));
 
   source.open();
   const auto before = source.read();

@@ -10,12 +10,10 @@
 #include <unistd.h>
 
 #include "platform/linux/base/ErrnoText.h"
-#include "platform/linux/drivers/DriverSourceLog.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(driversCategory, "RemovedFiles");
 // Without IN_MOVED_FROM: each update by renaming causes such an event for another name, and between
 // two sessions these would fill the kernel's queue.
 constexpr std::uint32_t kEvents = IN_DELETE | IN_MOVE_SELF | IN_ONLYDIR;
@@ -57,7 +55,7 @@ void RemovedFiles::watch() {
   // A directory that cannot be opened has no files either, so there is nothing to log.
   const bool isNoDirectory = errno == ENOENT || errno == ENOTDIR || errno == EACCES;
   if (isNoDirectory || std::exchange(isFailureLogged_, true)) return;
-  kLog.error("cannot watch the directory ", directory_.string(),
+  log_.error("cannot watch the directory ", directory_.string(),
              " for deleted files: ", errnoText(errno),
              "; a file that is deleted and written again counts as the same file");
 }

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "platform/linux/base/UniqueHandle.h"
+#include "platform/object_log.h"
 
 namespace halvox::platform::linux_ {
 
@@ -25,7 +26,9 @@ class RemovedFiles {
     std::vector<std::string> names{};
   };
 
-  explicit RemovedFiles(std::filesystem::path directory) : directory_(std::move(directory)) {}
+  // `log` must outlive this.
+  RemovedFiles(std::filesystem::path directory, LogCategory& log)
+      : directory_(std::move(directory)), log_(log, "RemovedFiles") {}
 
   // The files since the last call; none the first time. Does not block.
   [[nodiscard]] Removed take();
@@ -34,6 +37,7 @@ class RemovedFiles {
   void watch();
 
   const std::filesystem::path directory_;
+  const ObjectLog log_;
   UniqueFd inotify_;
   int watched_ = -1;  // the watch on the directory; -1 if there is none
   bool isFailureLogged_ = false;

@@ -6,6 +6,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
 namespace halvox::platform::linux_ {
@@ -21,7 +22,7 @@ class RemovedFilesTest : public ::testing::Test {
 
   FakePlatform platform_;
   ScratchDirectory directory_;
-  RemovedFiles removed_{directory_.path()};
+  RemovedFiles removed_{directory_.path(), driversCategory(platform_.log)};
 };
 
 TEST_F(RemovedFilesTest, AFileThatWasDeletedIsNamedOnceEvenWhenItIsThereAgain) {
@@ -51,7 +52,7 @@ TEST_F(RemovedFilesTest, AFileThatIsReplacedOrWrittenToWasNotDeleted) {
 
 TEST_F(RemovedFilesTest, WithTheDirectoryAllFilesGoAndTheNextOneIsWatched) {
   const auto place = directory_.path() / "place";
-  RemovedFiles removed(place);
+  RemovedFiles removed(place, driversCategory(platform_.log));
   EXPECT_FALSE(removed.take().areAll);
   std::filesystem::create_directory(place);
   EXPECT_FALSE(removed.take().areAll);

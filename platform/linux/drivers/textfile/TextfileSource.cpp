@@ -12,12 +12,10 @@
 
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/WholeFile.h"
-#include "platform/linux/drivers/DriverSourceLog.h"
 
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(driversCategory, "TextfileSource");
 // Twenty milliseconds: file times advance in steps of up to 10 ms. A file that is read within a
 // step may change again and keep its time.
 constexpr std::int64_t kTimeStep = 20'000'000;
@@ -100,7 +98,7 @@ std::vector<std::string> TextfileSource::list(int directory) {
   std::ranges::sort(files);
   const bool areTooMany = files.size() > kMostFiles;
   if (areTooMany && !std::exchange(isExcessLogged_, true)) {
-    kLog.error("the directory ", directory_.string(), " has more than ", kMostFiles,
+    log_.error("the directory ", directory_.string(), " has more than ", kMostFiles,
                " files; skipping those after the first ", kMostFiles);
   }
   isExcessLogged_ = areTooMany;
@@ -181,7 +179,7 @@ void TextfileSource::take(std::vector<MetricChannel>&& channels, Entry& entry) {
 void TextfileSource::complain(const std::string& file, const std::string& what, Entry& entry) {
   if (entry.complaint == what) return;
   entry.complaint = what;
-  kLog.error("driver counters of ", (directory_ / file).string(), what);
+  log_.error("driver counters of ", (directory_ / file).string(), what);
 }
 
 void TextfileSource::chooseChannels() {

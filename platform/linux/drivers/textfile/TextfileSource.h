@@ -15,6 +15,7 @@
 #include "platform/linux/drivers/ReadingMaker.h"
 #include "platform/linux/drivers/textfile/MetricChannels.h"
 #include "platform/linux/drivers/textfile/RemovedFiles.h"
+#include "platform/object_log.h"
 
 namespace halvox::platform::linux_ {
 
@@ -34,8 +35,11 @@ class TextfileSource final : public DriverSource {
   // MiB took the service to half a gigabyte.
   static constexpr std::size_t kMostBytes = 8U << 20U;
 
-  explicit TextfileSource(std::filesystem::path directory)
-      : directory_(std::move(directory)), removedFiles_(directory_) {}
+  // `log` must outlive the source.
+  TextfileSource(std::filesystem::path directory, LogCategory& log)
+      : directory_(std::move(directory)),
+        log_(log, "TextfileSource"),
+        removedFiles_(directory_, log) {}
 
   [[nodiscard]] std::string_view name() const override { return "textfile"; }
   [[nodiscard]] std::shared_ptr<const Reading> read() override;
@@ -73,6 +77,7 @@ class TextfileSource final : public DriverSource {
   void chooseChannels();
 
   const std::filesystem::path directory_;
+  const ObjectLog log_;
   RemovedFiles removedFiles_;
   std::map<std::string, Entry> entries_;  // by file name
   std::uint64_t round_ = 0;

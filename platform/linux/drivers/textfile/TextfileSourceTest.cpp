@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/testing/MadeReadings.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
@@ -41,7 +42,7 @@ class TextfileSourceTest : public ::testing::Test {
 
   FakePlatform platform_;
   ScratchDirectory directory_;
-  TextfileSource source_{directory_.path()};
+  TextfileSource source_{directory_.path(), driversCategory(platform_.log)};
 };
 
 TEST_F(TextfileSourceTest, FilesOfTheDirectoryAreChannels) {
@@ -160,7 +161,7 @@ TEST_F(TextfileSourceTest, AFileThatIsDeletedAndWrittenAgainBetweenTwoReadingsHa
 TEST_F(TextfileSourceTest, ADirectoryThatIsReplacedHasOtherChannels) {
   const auto place = directory_.path() / "place";
   std::filesystem::create_directory(place);
-  TextfileSource source(place);
+  TextfileSource source(place, driversCategory(platform_.log));
   writePulses("place/a.prom", 3);
   const auto before = source.read();
   std::filesystem::rename(place, directory_.path() / "old");
@@ -235,7 +236,7 @@ TEST_F(TextfileSourceTest, AHugeFileIsNotRead) {
 }
 
 TEST_F(TextfileSourceTest, ADirectoryThatIsMissingIsEmptyAndMayComeLater) {
-  TextfileSource source(directory_.path() / "later");
+  TextfileSource source(directory_.path() / "later", driversCategory(platform_.log));
   EXPECT_EQ(source.read()->channels->size(), 0U);
 
   std::filesystem::create_directory(directory_.path() / "later");

@@ -144,8 +144,8 @@ class LttngHarness {
   const fs::path traces_ = directory_.path() / "traces";
   linux_::AsioDispatchService dispatch_{fakes_.log, fakes_.statistics};
   linux_::LttngControl control_{traces_};
-  linux_::LttngKtraceService ktrace_{control_, fakes_.statistics};
-  linux_::LttngPerformanceTraceService performanceTraces_{control_, fakes_.statistics};
+  linux_::LttngKtraceService ktrace_{control_, fakes_.log, fakes_.statistics};
+  linux_::LttngPerformanceTraceService performanceTraces_{control_, fakes_.log, fakes_.statistics};
 };
 
 class LttngKtraceHarness : public LttngHarness {

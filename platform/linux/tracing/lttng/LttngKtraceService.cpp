@@ -11,8 +11,6 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(tracingCategory, "LttngKtraceService");
-
 constexpr int kNotStarted = 1;
 constexpr int kNoRange = 2;
 constexpr int kUnsuitable = 3;  // no session, or not in the state for the call
@@ -119,8 +117,10 @@ void DeliveryGate::stop() {
   changed_.notifyAll();
 }
 
-LttngKtraceService::LttngKtraceService(LttngControl& control, StatisticsService& statistics)
+LttngKtraceService::LttngKtraceService(LttngControl& control, LogService& log,
+                                       StatisticsService& statistics)
     : control_(control),
+      log_(tracingLog(log, "LttngKtraceService")),
       started_(statistics.counter("kernel traces", "traces started")),
       failed_(statistics.counter("kernel traces", "traces that failed")),
       read_(statistics.counter("kernel traces", "events read back")),
@@ -167,7 +167,7 @@ int LttngKtraceService::ktrace_start(const Session& session, std::shared_ptr<Dis
   auto begun = control_.begin({.event = "halvox:kdebug", .filter = ours->filter()});
   if (!begun) {
     failed_.add();
-    kLog.error("cannot start a kernel trace: ", begun.error().message, "; nothing is recorded");
+    log_.error("cannot start a kernel trace: ", begun.error().message, "; nothing is recorded");
     return kNotStarted;
   }
   ours->recording = *std::move(begun);
@@ -188,7 +188,7 @@ void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& sessi
   if (session->recording.has_value()) {
     const auto ended = control_.end(*session->recording);
     if (!ended) {
-      kLog.error("cannot end a kernel trace: ", ended.error().message,
+      log_.error("cannot end a kernel trace: ", ended.error().message,
                  "; delivering what was recorded");
     }
     const bool isRead = deliverAll(session);
@@ -230,11 +230,11 @@ bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
   lost_.add(reading.lost);
   lostPackets_.add(reading.lostPackets);
   if (reading.failure) {
-    kLog.error("cannot read a kernel trace back: ", *reading.failure,
+    log_.error("cannot read a kernel trace back: ", *reading.failure,
                "; its remaining events are lost");
   }
   if (reading.lost + reading.lostPackets > 0) {
-    kLog.error("the tracer's buffers had no room for ", reading.lost, " events and ",
+    log_.error("the tracer's buffers had no room for ", reading.lost, " events and ",
                reading.lostPackets, " packets of a kernel trace; they are lost");
   }
   return !reading.failure.has_value();

@@ -7,6 +7,7 @@
 #include "platform/linux/base/Mutex.h"
 #include "platform/linux/tracing/QueueOnDemand.h"
 #include "platform/linux/tracing/lttng/LttngControl.h"
+#include "platform/object_log.h"
 #include "platform/statistics.h"
 
 namespace halvox::platform::linux_ {
@@ -48,8 +49,8 @@ class DeliveryGate {
 // had no room for are counted and logged once a trace. No file of a trace remains.
 class LttngKtraceService final : public KtraceService {
  public:
-  // Both must outlive the service.
-  LttngKtraceService(LttngControl& control, StatisticsService& statistics);
+  // All three must outlive the service.
+  LttngKtraceService(LttngControl& control, LogService& log, StatisticsService& statistics);
 
   // From now on nothing waits for queues. Events that have not been delivered are dropped and
   // counted.
@@ -77,6 +78,7 @@ class LttngKtraceService final : public KtraceService {
   static constexpr unsigned kBatchesAhead = 8;  // of 4,096 events each
 
   LttngControl& control_;
+  const ObjectLog log_;
   Counter& started_;
   Counter& failed_;
   Counter& read_;

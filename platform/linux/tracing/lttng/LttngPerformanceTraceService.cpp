@@ -16,8 +16,6 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr UnitLog kLog(tracingCategory, "LttngPerformanceTraceService");
-
 constexpr std::size_t kKeptTraces = 20;
 constexpr const char* kTraceStart = "trace-";
 constexpr const char* kTraceEnd = ".tar.zst";
@@ -60,6 +58,7 @@ void removeOldTraces(const std::filesystem::path& directory) {
 // sessions, which may outlive the service object.
 struct LttngPerformanceTraceService::Work {
   LttngControl& control;
+  ObjectLog log;
   Counter& started;
   Counter& failed;
   Counter& saved;
@@ -160,8 +159,8 @@ class LttngTraceSession final : public KQTraceSession,
     if (!error) error = saveError;
     work_->count(error);
     if (error) {
-      kLog.error("a performance trace failed: ", error->description,
-                 "; reporting this to its session");
+      work_->log.error("a performance trace failed: ", error->description,
+                       "; reporting this to its session");
     }
     if (const auto listener = delegate()) listener->kqTraceDidComplete(url, 0, error);
   }
@@ -175,10 +174,11 @@ class LttngTraceSession final : public KQTraceSession,
 
 }  // namespace
 
-LttngPerformanceTraceService::LttngPerformanceTraceService(LttngControl& control,
+LttngPerformanceTraceService::LttngPerformanceTraceService(LttngControl& control, LogService& log,
                                                            StatisticsService& statistics)
     : work_(std::make_shared<Work>(
           Work{.control = control,
+               .log = tracingLog(log, "LttngPerformanceTraceService"),
                .started = statistics.counter("performance traces", "traces started"),
                .failed = statistics.counter("performance traces", "traces that failed"),
                .saved = statistics.counter("performance traces", "traces saved"),

@@ -4,6 +4,7 @@
 
 #include "platform/linux/tracing/QueueOnDemand.h"
 #include "platform/linux/tracing/lttng/LttngControl.h"
+#include "platform/log.h"
 #include "platform/performance_trace.h"
 #include "platform/statistics.h"
 
@@ -22,8 +23,9 @@ namespace halvox::platform::linux_ {
 // more is deleted without a call, and a delegate that has been destroyed is not called.
 class LttngPerformanceTraceService final : public PerformanceTraceService {
  public:
-  // Both must outlive the service and the work of its sessions.
-  LttngPerformanceTraceService(LttngControl& control, StatisticsService& statistics);
+  // All three must outlive the service and the work of its sessions.
+  LttngPerformanceTraceService(LttngControl& control, LogService& log,
+                               StatisticsService& statistics);
 
   // Releases the queue. Call it after the queues have ended.
   void close() { queue_.release(); }

@@ -9,10 +9,11 @@ namespace {
 
 class LttngTraceServices final : public TraceServices {
  public:
-  LttngTraceServices(const std::filesystem::path& tracesDirectory, StatisticsService& statistics)
+  LttngTraceServices(const std::filesystem::path& tracesDirectory, LogService& log,
+                     StatisticsService& statistics)
       : control_(tracesDirectory),
-        ktrace_(control_, statistics),
-        performanceTraces_(control_, statistics) {}
+        ktrace_(control_, log, statistics),
+        performanceTraces_(control_, log, statistics) {}
 
   KtraceService& ktrace() override { return ktrace_; }
   PerformanceTraceService& performanceTraces() override { return performanceTraces_; }
@@ -36,8 +37,9 @@ class LttngTraceServices final : public TraceServices {
 }  // namespace
 
 std::unique_ptr<TraceServices> makeLttngTraceServices(const std::filesystem::path& tracesDirectory,
+                                                      LogService& log,
                                                       StatisticsService& statistics) {
-  return std::make_unique<LttngTraceServices>(tracesDirectory, statistics);
+  return std::make_unique<LttngTraceServices>(tracesDirectory, log, statistics);
 }
 
 }  // namespace halvox::platform::linux_

@@ -7,8 +7,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Traces by LTTng, recorded in that directory. The statistics must outlive them.
+// Traces by LTTng, recorded in that directory. The log and the statistics must outlive them.
 [[nodiscard]] std::unique_ptr<TraceServices> makeLttngTraceServices(
-    const std::filesystem::path& tracesDirectory, StatisticsService& statistics);
+    const std::filesystem::path& tracesDirectory, LogService& log, StatisticsService& statistics);
 
 }  // namespace halvox::platform::linux_

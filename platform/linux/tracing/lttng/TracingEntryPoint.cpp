@@ -4,9 +4,9 @@
 
 namespace halvox::platform::linux_ {
 
-TraceServices* halvox_tracing_lttng_1(const std::filesystem::path& tracesDirectory,
+TraceServices* halvox_tracing_lttng_2(const std::filesystem::path& tracesDirectory, LogService& log,
                                       StatisticsService& statistics) {
-  return makeLttngTraceServices(tracesDirectory, statistics).release();
+  return makeLttngTraceServices(tracesDirectory, log, statistics).release();
 }
 
 }  // namespace halvox::platform::linux_

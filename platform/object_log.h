@@ -1,0 +1,48 @@
+#pragma once
+
+#include <string_view>
+
+#include "platform/log.h"
+
+namespace halvox::platform {
+
+// What one object logs with: the category that it got when it was made, and the name of its unit.
+// An object that is given the log service has one of these as a member, in place of a UnitLog,
+// whose category is looked up once for the life of the process.
+//
+//   log_.info("watching ", directory);
+//
+// Copies are cheap. Any thread may use it. The log service owns the category and must outlive this.
+class ObjectLog {
+ public:
+  // `unit` is a constant.
+  ObjectLog(LogCategory& category, std::string_view unit) : category_(&category), unit_(unit) {}
+
+  template <typename... Parts>
+  void debug(const UnitLog::Text& text, const Parts&... parts) const {
+    UnitLog::logTo(*category_, unit_, LogLevel::kDebug, text, parts...);
+  }
+  template <typename... Parts>
+  void info(const UnitLog::Text& text, const Parts&... parts) const {
+    UnitLog::logTo(*category_, unit_, LogLevel::kInfo, text, parts...);
+  }
+  template <typename... Parts>
+  void notice(const UnitLog::Text& text, const Parts&... parts) const {
+    UnitLog::logTo(*category_, unit_, LogLevel::kDefault, text, parts...);
+  }
+  template <typename... Parts>
+  void error(const UnitLog::Text& text, const Parts&... parts) const {
+    UnitLog::logTo(*category_, unit_, LogLevel::kError, text, parts...);
+  }
+  // The same at a level that the caller chooses.
+  template <typename... Parts>
+  void log(LogLevel level, const UnitLog::Text& text, const Parts&... parts) const {
+    UnitLog::logTo(*category_, unit_, level, text, parts...);
+  }
+
+ private:
+  LogCategory* category_;
+  std::string_view unit_;
+};
+
+}  // namespace halvox::platform
