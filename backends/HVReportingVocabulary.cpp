@@ -12,7 +12,7 @@ platform::LogCategory& makeCategory(std::string_view name) {
 
 }  // namespace
 
-// Each category is made on first use: the log service is installed after static initialisation.
+// Static: made on first use and kept for the life of the process; this is required.
 platform::LogCategory& HVReportingClientCategory() {
   static platform::LogCategory& category = makeCategory("hvrc");
   return category;

@@ -26,13 +26,6 @@ using platform::PerformanceTraceService;
 // The log of the framework's callbacks.
 constexpr platform::UnitLog kTraceLog(&HVReportingTraceCategory, "HVReportingSession");
 
-// The general log of the service, for one line without the name of a source.
-platform::LogCategory& generalCategory() {
-  static platform::LogCategory& category =
-      platform::log().createCategory(kHVReportingLogSubsystem, "general");
-  return category;
-}
-
 bool isTracingOn() {
   return platform::featureFlags()._os_feature_enabled_impl("Acoustat", "Tracing");
 }
@@ -151,7 +144,9 @@ void SessionTracing::stop() {
 }
 
 void SessionTracing::kqTraceDidStart(const std::optional<Error>& error) {
-  generalCategory().write(platform::LogLevel::kDefault, "started performance trace.");
+  platform::log()
+      .createCategory(kHVReportingLogSubsystem, "general")
+      .write(platform::LogLevel::kDefault, "started performance trace.");
   if (!error.has_value()) {
     kTraceLog.info("Performance Trace Started");
     return;

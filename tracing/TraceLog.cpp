@@ -5,7 +5,7 @@
 namespace halvox {
 
 platform::LogCategory& HVReportingTraceCategory() {
-  // Not a namespace-scope variable: the log service is installed after static initialisation.
+  // Static: made on first use and kept for the life of the process; this is required.
   static platform::LogCategory& category =
       platform::log().createCategory("com.tarno.halvox", "hvrt");
   return category;
