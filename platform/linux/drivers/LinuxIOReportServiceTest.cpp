@@ -69,6 +69,18 @@ class LinuxIOReportServiceTest : public ::testing::Test {
     return service_->IOReportCopyChannelsInGroup(group, subGroup, error);
   }
 
+  // Serves one channel and samples it once, which its source is too late for. The gate is closed.
+  IOReportService::Channels serveLateSource() {
+    serve([this] {
+      gate_.pass();
+      return makeReading({simpleChannel("Tx", "a")}, {1});
+    });
+    auto found = find("Tx", std::nullopt);
+    gate_.close();
+    static_cast<void>(sample(found));
+    return found;
+  }
+
   std::vector<std::string> show(const IOReportService::Samples& samples) {
     std::vector<std::string> lines;
     service_->IOReportIterate(samples, [&lines](const IOReportChannel& channel) {
@@ -227,13 +239,7 @@ TEST_F(LinuxIOReportServiceTest, ASlowSourceIsSkippedAndTheOthersAreNot) {
 
 TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndItIsLoggedOnce) {
   longestWait_ = SourceReader::kLongestWait;
-  serve([&] {
-    gate_.pass();
-    return makeReading({simpleChannel("Tx", "a")}, {1});
-  });
-  const auto found = find("Tx", std::nullopt);
-  gate_.close();
-  static_cast<void>(sample(found));
+  const auto found = serveLateSource();
 
   // Waiting again would make each of them slow, a busy machine only some.
   constexpr int kRounds = 20;
@@ -254,13 +260,7 @@ TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndItIsLoggedOnce
 
 TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
   longestWait_ = kShortWait;
-  serve([&] {
-    gate_.pass();
-    return makeReading({simpleChannel("Tx", "a")}, {1});
-  });
-  const auto found = find("Tx", std::nullopt);
-  gate_.close();
-  static_cast<void>(sample(found));
+  const auto found = serveLateSource();
   gate_.open();
 
   EXPECT_TRUE(eventually([&] { return show(sample(found)).size() == 1; }));
