@@ -5,7 +5,6 @@
 #include <memory>
 #include <span>
 #include <string>
-#include <variant>
 
 #include <sysexits.h>
 
@@ -54,11 +53,9 @@ int print(const std::string& text) {
 
 int configureAndServe() {
   const auto loaded = platform::linux_::loadConfiguration();
-  if (const auto* error = std::get_if<ConfigurationError>(&loaded)) {
-    const bool wrong = error->kind == ConfigurationError::Kind::kWrong;
-    return refuse(wrong ? EX_CONFIG : EX_NOINPUT, error->description);
-  }
-  return serve(std::get<Configuration>(loaded));
+  if (loaded) return serve(*loaded);
+  const bool wrong = loaded.error().code == ConfigurationError::kWrong;
+  return refuse(wrong ? EX_CONFIG : EX_NOINPUT, loaded.error().message);
 }
 
 int run(std::span<const char* const> arguments) {

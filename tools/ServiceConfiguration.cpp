@@ -15,7 +15,6 @@ namespace halvox::tools {
 namespace {
 
 using platform::linux_::Configuration;
-using platform::linux_::ConfigurationError;
 
 constexpr const char* kDatabaseName = "halvox.db";
 
@@ -51,10 +50,8 @@ std::variant<Configuration, ExitStatus> configurationWith(const StoreSearch& sea
                                                           const Complaint& complain) {
   auto loaded =
       platform::linux_::loadConfiguration({.socket = {}, .storageDirectory = search.directory});
-  if (const auto* error = std::get_if<ConfigurationError>(&loaded)) {
-    return complain(ExitStatus::kBadConfiguration, error->description);
-  }
-  return std::get<Configuration>(std::move(loaded));
+  if (!loaded) return complain(ExitStatus::kBadConfiguration, loaded.error().message);
+  return *std::move(loaded);
 }
 
 }  // namespace
@@ -69,8 +66,8 @@ std::variant<std::string, ExitStatus> namedSocket(const CommonOptions& options,
   // cannot fail.
   if (!options.socket.empty() || isSocketInTheEnvironment()) return options.socket;
   const auto named = platform::linux_::configuredSocket();
-  if (const auto* path = std::get_if<std::filesystem::path>(&named)) return path->native();
-  return complain(ExitStatus::kBadConfiguration, std::get<ConfigurationError>(named).description);
+  if (named) return named->native();
+  return complain(ExitStatus::kBadConfiguration, named.error().message);
 }
 
 std::variant<std::filesystem::path, ExitStatus> findStore(const Complaint& complain) {

@@ -4,7 +4,6 @@
 #include <exception>
 #include <filesystem>
 #include <string>
-#include <variant>
 
 #include <CLI/CLI.hpp>
 #include <fmt/format.h>
@@ -68,12 +67,12 @@ bool completeFromConfiguration(Arguments& arguments) {
   const char* variable = std::getenv("HALVOX_SOCKET");
   if (!arguments.socket.empty() || (variable != nullptr && *variable != '\0')) return true;
   const auto named = halvox::platform::linux_::configuredSocket();
-  if (const auto* path = std::get_if<std::filesystem::path>(&named)) {
-    arguments.socket = path->native();
-    return true;
+  if (named) {
+    arguments.socket = named->native();
+  } else {
+    logLine(named.error().message);
   }
-  logLine(std::get<halvox::platform::linux_::ConfigurationError>(named).description);
-  return false;
+  return named.has_value();
 }
 
 void run(const Arguments& arguments) {

@@ -46,8 +46,8 @@ std::string oneLine(std::string_view text) {
   return line;
 }
 
-ConfigurationError unreadable(const std::filesystem::path& file, int error) {
-  return {ConfigurationError::Kind::kUnreadable,
+Failure<ConfigurationError> unreadable(const std::filesystem::path& file, int error) {
+  return {ConfigurationError::kUnreadable,
           oneLine(fmt::format("{}: the configuration cannot be read: {}", file.native(),
                               errnoText(error)))};
 }
@@ -55,8 +55,7 @@ ConfigurationError unreadable(const std::filesystem::path& file, int error) {
 // The file's text; none when there is no such file. It may be a pipe, such as the one that a shell
 // makes of <(command). Opening one does not block: a pipe that nobody writes to must not hold up
 // the start.
-std::variant<std::optional<std::string>, ConfigurationError> readText(
-    const std::filesystem::path& file) {
+Result<std::optional<std::string>, ConfigurationError> readText(const std::filesystem::path& file) {
   FileContent content =
       readWholeFile({.path = file.c_str(), .most = kLargestFile, .kinds = FileToRead::Kinds::kAny});
   switch (content.outcome) {
@@ -65,8 +64,8 @@ std::variant<std::optional<std::string>, ConfigurationError> readText(
     case FileContent::Outcome::kMissing:
       return std::nullopt;
     case FileContent::Outcome::kTooLarge:
-      return ConfigurationError{
-          ConfigurationError::Kind::kWrong,
+      return Failure<ConfigurationError>{
+          ConfigurationError::kWrong,
           oneLine(fmt::format("{}:1:1: the file: expected at most {} bytes, found more",
                               file.native(), kLargestFile))};
     case FileContent::Outcome::kNotRegular:
@@ -245,9 +244,8 @@ void readDrivers(TableReader table, Configuration::Drivers& drivers) {
   table.finish();
 }
 
-std::variant<Configuration, ConfigurationError> parse(const std::string& file,
-                                                      std::string_view text,
-                                                      const DefaultPlaces& places) {
+Result<Configuration, ConfigurationError> parse(const std::string& file, std::string_view text,
+                                                const DefaultPlaces& places) {
   ConfigurationMistakes mistakes(file);
   // Before the parser, which bounds brackets but not dots: a key of 100,000 words makes as many
   // tables, and walking through them overflows the stack.
@@ -312,28 +310,24 @@ Configuration defaultConfiguration(const DefaultPlaces& places) {
   return configuration;
 }
 
-std::variant<Configuration, ConfigurationError> loadConfiguration(const DefaultPlaces& places) {
+Result<Configuration, ConfigurationError> loadConfiguration(const DefaultPlaces& places) {
   const std::filesystem::path file = configurationPath();
-  auto content = readText(file);
-  if (auto* error = std::get_if<ConfigurationError>(&content)) return std::move(*error);
-  const auto& text = std::get<std::optional<std::string>>(content);
-  if (text.has_value()) return parse(file.native(), *text, places);
+  const auto text = readText(file);
+  if (!text) return text.error();
+  if (text->has_value()) return parse(file.native(), **text, places);
   // A file that the user has named must exist. A default place may be empty.
   if (configurationVariable() != nullptr) return unreadable(file, ENOENT);
   return defaultConfiguration(places);
 }
 
-std::variant<std::filesystem::path, ConfigurationError> configuredSocket() {
+Result<std::filesystem::path, ConfigurationError> configuredSocket() {
   // Without a default socket: a socket in the result is then one that the file names.
   auto loaded = loadConfiguration({.socket = {}, .storageDirectory = defaultStorageDirectory()});
-  if (auto* configuration = std::get_if<Configuration>(&loaded)) {
-    return std::move(configuration->listener.socket);
-  }
-  auto& error = std::get<ConfigurationError>(loaded);
+  if (loaded) return std::move(loaded->listener.socket);
   const bool isHidden =
-      error.kind == ConfigurationError::Kind::kUnreadable && configurationVariable() == nullptr;
+      loaded.error().code == ConfigurationError::kUnreadable && configurationVariable() == nullptr;
   if (isHidden) return std::filesystem::path();
-  return std::move(error);
+  return std::move(loaded).error();
 }
 
 }  // namespace halvox::platform::linux_

@@ -7,9 +7,9 @@
 #include <map>
 #include <optional>
 #include <string>
-#include <variant>
 #include <vector>
 
+#include "platform/linux/base/Result.h"
 #include "platform/linux/configuration/Defaults.h"
 #include "platform/log.h"
 #include "platform/value.h"
@@ -89,16 +89,12 @@ struct Configuration {
   FeatureSwitches features;  // [features.Domain]: name to switch
 };
 
-// Why a configuration cannot be used. `description` is one line for the user: for a file with a
-// mistake "FILE:LINE:COLUMN: KEY: expected X, found Y", for an unreadable file its name and the
-// reason.
-struct ConfigurationError {
-  enum class Kind : std::uint8_t {
-    kWrong,       // a mistake in the file: exit status 78
-    kUnreadable,  // the file cannot be read: exit status 66
-  };
-  Kind kind = Kind::kWrong;
-  std::string description;
+// Why a configuration cannot be used. The message of the failure is one line for the user: for a
+// file with a mistake "FILE:LINE:COLUMN: KEY: expected X, found Y", for an unreadable file its name
+// and the reason.
+enum class ConfigurationError : std::uint8_t {
+  kWrong,       // a mistake in the file: exit status 78
+  kUnreadable,  // the file cannot be read: exit status 66
 };
 
 // The file that the environment names: $HALVOX_CONFIG, else $XDG_CONFIG_HOME/halvox/halvox.toml
@@ -121,12 +117,12 @@ Configuration defaultConfiguration(const DefaultPlaces& places = placesOfService
 // Reads the file of configurationPath(). Without a file all settings have their defaults, but a
 // file that $HALVOX_CONFIG names must exist. Of several mistakes, the first in the file is
 // returned.
-std::variant<Configuration, ConfigurationError> loadConfiguration(
+Result<Configuration, ConfigurationError> loadConfiguration(
     const DefaultPlaces& places = placesOfService());
 
 // Returns the socket that the configuration names, for programs that look for the service; empty if
 // it names none. Also empty if this user may not read the file and $HALVOX_CONFIG does not name it:
 // the system's file may be readable to the service alone.
-std::variant<std::filesystem::path, ConfigurationError> configuredSocket();
+Result<std::filesystem::path, ConfigurationError> configuredSocket();
 
 }  // namespace halvox::platform::linux_

@@ -7,7 +7,6 @@
 #include <string>
 #include <string_view>
 #include <utility>
-#include <variant>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -46,27 +45,24 @@ class ConfigurationFixture : public ::testing::Test {
     std::ofstream(file, std::ios::binary) << text;
     return file;
   }
-  std::variant<Configuration, ConfigurationError> load(std::string_view text) {
+  Result<Configuration, ConfigurationError> load(std::string_view text) {
     ::setenv("HALVOX_CONFIG", write(text).c_str(), 1);
     return loadConfiguration();
   }
   Configuration loaded(std::string_view text) {
     auto result = load(text);
-    if (const auto* error = std::get_if<ConfigurationError>(&result)) {
-      ADD_FAILURE() << error->description;
-      return {};
-    }
-    return std::get<Configuration>(std::move(result));
+    if (result) return *std::move(result);
+    ADD_FAILURE() << result.error().message;
+    return {};
   }
   // The error for a file with `text`, without the file's name.
   std::string mistake(std::string_view text) {
     const auto result = load(text);
-    const auto* error = std::get_if<ConfigurationError>(&result);
-    if (error == nullptr) return "(none)";
-    EXPECT_EQ(error->kind, ConfigurationError::Kind::kWrong);
+    if (result) return "(none)";
+    EXPECT_EQ(result.error().code, ConfigurationError::kWrong);
     const std::string prefix = (directory_ / "halvox.toml").native() + ":";
-    EXPECT_THAT(error->description, ::testing::StartsWith(prefix));
-    return error->description.substr(prefix.size());
+    EXPECT_THAT(result.error().message, ::testing::StartsWith(prefix));
+    return result.error().message.substr(prefix.size());
   }
 
   const ScratchDirectory scratch_;

@@ -82,7 +82,7 @@ void ConfigurationMistakes::add(const toml::source_position& where, std::string_
   appendEscaped(line, fmt::format("{}:{}:{}: {}", file_, where.line, where.column, what),
                 kLongestError);
   firstPosition_ = where;
-  first_ = ConfigurationError{ConfigurationError::Kind::kWrong, std::move(line)};
+  first_ = Failure<ConfigurationError>{ConfigurationError::kWrong, std::move(line)};
 }
 
 TableReader TableReader::table(std::string_view key) {

@@ -30,12 +30,12 @@ class ConfigurationMistakes {
   // Adds the mistake "FILE:LINE:COLUMN: what". Control characters are escaped, so that the error
   // stays one line.
   void add(const toml::source_position& where, std::string_view what);
-  [[nodiscard]] const std::optional<ConfigurationError>& first() const { return first_; }
+  [[nodiscard]] const std::optional<Failure<ConfigurationError>>& first() const { return first_; }
 
  private:
   const std::string file_;
   toml::source_position firstPosition_{};
-  std::optional<ConfigurationError> first_;
+  std::optional<Failure<ConfigurationError>> first_;
 };
 
 struct NumberRange {

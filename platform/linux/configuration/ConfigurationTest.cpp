@@ -11,8 +11,8 @@ TEST_F(ConfigurationTest, MissingFileMeansDefaults) {
   if (std::filesystem::exists("/etc/halvox/halvox.toml")) GTEST_SKIP() << "this system has one";
   const auto result = loadConfiguration();
 
-  ASSERT_TRUE(std::holds_alternative<Configuration>(result));
-  const auto& configuration = std::get<Configuration>(result);
+  ASSERT_TRUE(result);
+  const Configuration& configuration = *result;
   EXPECT_EQ(configuration.listener.socket, "/run/halvox/reporting.sock");
   EXPECT_EQ(configuration.storage.directory, directory_ / ".local/state/halvox");
   EXPECT_EQ(configuration.storage.root, directory_ / ".local/state/halvox/root");
@@ -68,8 +68,7 @@ TEST_F(ConfigurationTest, RelativeDirectoriesOfTheEnvironmentAreIgnored) {
 TEST_F(ConfigurationTest, ProgramsMayHaveOtherPlacesByDefault) {
   ::setenv("HALVOX_CONFIG", write("").c_str(), 1);
 
-  const auto configuration =
-      std::get<Configuration>(loadConfiguration({.socket = {}, .storageDirectory = "/there"}));
+  const auto configuration = *loadConfiguration({.socket = {}, .storageDirectory = "/there"});
 
   EXPECT_EQ(configuration.listener.socket, "");
   EXPECT_EQ(configuration.storage.directory, "/there");
@@ -79,13 +78,13 @@ TEST_F(ConfigurationTest, ProgramsMayHaveOtherPlacesByDefault) {
 TEST_F(ConfigurationTest, ProgramsGetTheSocketOnlyWhenTheFileNamesIt) {
   ::setenv("XDG_RUNTIME_DIR", "/run/user/7", 1);
   ::setenv("HALVOX_CONFIG", write("").c_str(), 1);
-  EXPECT_EQ(std::get<std::filesystem::path>(configuredSocket()), "");
+  EXPECT_EQ(*configuredSocket(), "");
 
   ::setenv("HALVOX_CONFIG", write("[listener]\nsocket = \"/named\"").c_str(), 1);
-  EXPECT_EQ(std::get<std::filesystem::path>(configuredSocket()), "/named");
+  EXPECT_EQ(*configuredSocket(), "/named");
 
   ::setenv("HALVOX_CONFIG", write("[listener]\nsocket = 7").c_str(), 1);
-  EXPECT_TRUE(std::holds_alternative<ConfigurationError>(configuredSocket()));
+  EXPECT_FALSE(configuredSocket());
 }
 
 TEST_F(ConfigurationTest, FileOfTheUserComesBeforeThatOfTheSystem) {

@@ -20,7 +20,6 @@
 #include <optional>
 #include <sstream>
 #include <string>
-#include <variant>
 
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/configuration/Configuration.h"
@@ -197,9 +196,9 @@ int drive(const Configuration& configuration) {
 
 int main() {
   const auto loaded = loadConfiguration();
-  if (const auto* error = std::get_if<ConfigurationError>(&loaded)) {
-    std::cerr << error->description << std::endl;
+  if (!loaded) {
+    std::cerr << loaded.error().message << std::endl;
     return EXIT_FAILURE;
   }
-  return drive(std::get<Configuration>(loaded));
+  return drive(*loaded);
 }
