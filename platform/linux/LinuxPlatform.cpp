@@ -87,8 +87,8 @@ std::optional<StartFailure> LinuxPlatform::open() {
   adapters_->diagnosticReporters.removeLeftovers();
   adapters_->traces->open();
   adapters_->ioReport.open();
-  if (const auto error = adapters_->connections.open()) {
-    return startFailure(*error);
+  if (const auto opened = adapters_->connections.open(); !opened) {
+    return startFailure(opened.error());
   }
   logStart();
   return std::nullopt;

@@ -24,24 +24,24 @@ int exitStatus(StoreError::Kind kind) {
   return EX_SOFTWARE;
 }
 
-int exitStatus(ConnectionOpenError::Kind kind) {
-  switch (kind) {
-    case ConnectionOpenError::Kind::kPathTooLong:
-    case ConnectionOpenError::Kind::kUnknownGroup:
+int exitStatus(ConnectionOpenError error) {
+  switch (error) {
+    case ConnectionOpenError::kPathTooLong:
+    case ConnectionOpenError::kUnknownGroup:
       return EX_CONFIG;
-    case ConnectionOpenError::Kind::kNotPermitted:
+    case ConnectionOpenError::kNotPermitted:
       return EX_NOPERM;
-    case ConnectionOpenError::Kind::kDirectoryMissing:
-    case ConnectionOpenError::Kind::kDirectoryNotWritable:
-    case ConnectionOpenError::Kind::kNotASocket:
+    case ConnectionOpenError::kDirectoryMissing:
+    case ConnectionOpenError::kDirectoryNotWritable:
+    case ConnectionOpenError::kNotASocket:
       return EX_CANTCREAT;
-    case ConnectionOpenError::Kind::kAlreadyServed:
-    case ConnectionOpenError::Kind::kBusUnreachable:
-    case ConnectionOpenError::Kind::kBusNameTaken:
+    case ConnectionOpenError::kAlreadyServed:
+    case ConnectionOpenError::kBusUnreachable:
+    case ConnectionOpenError::kBusNameTaken:
       return EX_UNAVAILABLE;
-    case ConnectionOpenError::Kind::kBadActivation:
+    case ConnectionOpenError::kBadActivation:
       return EX_USAGE;
-    case ConnectionOpenError::Kind::kSystem:
+    case ConnectionOpenError::kSystem:
       return EX_OSERR;
   }
   return EX_SOFTWARE;
@@ -53,8 +53,8 @@ StartFailure startFailure(const StoreError& error) {
   return {exitStatus(error.kind), error.description};
 }
 
-StartFailure startFailure(const ConnectionOpenError& error) {
-  return {exitStatus(error.kind), error.description};
+StartFailure startFailure(const Failure<ConnectionOpenError>& failure) {
+  return {exitStatus(failure.code), failure.message};
 }
 
 }  // namespace halvox::platform::linux_

@@ -1,10 +1,13 @@
 #pragma once
 
+#include <cstdint>
 #include <string>
+
+#include "platform/linux/base/Result.h"
 
 namespace halvox::platform::linux_ {
 
-struct ConnectionOpenError;
+enum class ConnectionOpenError : std::uint8_t;
 struct StoreError;
 
 // Why the service cannot start: one line for the user, and an exit status of sysexits.h, by which
@@ -15,6 +18,6 @@ struct StartFailure {
 };
 
 [[nodiscard]] StartFailure startFailure(const StoreError& error);
-[[nodiscard]] StartFailure startFailure(const ConnectionOpenError& error);
+[[nodiscard]] StartFailure startFailure(const Failure<ConnectionOpenError>& failure);
 
 }  // namespace halvox::platform::linux_

@@ -18,8 +18,6 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-using Kind = ConnectionOpenError::Kind;
-
 // A local bus answers within milliseconds. The start of the service must not hang on a broken one.
 constexpr std::chrono::seconds kBusTimeout{5};
 constexpr std::uint32_t kDoNotQueue = 4;    // flag of RequestName: fail if the name is taken
@@ -30,20 +28,22 @@ constexpr std::string_view kVanishingNames =
     "type='signal',sender='org.freedesktop.DBus',interface='org.freedesktop.DBus',"
     "member='NameOwnerChanged',path='/org/freedesktop/DBus',arg2=''";
 
-// A connected socket, or an errno value.
-std::variant<UniqueFd, int> connectTo(const BusSocket& bus) {
+Result<UniqueFd> connectTo(const BusSocket& bus) {
+  const auto failure = [&](int error) { return Failure<>{bus.name + ": " + errnoText(error)}; };
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   const std::size_t start = bus.space == BusSocket::Space::kAbstract ? 1 : 0;
-  if (bus.name.size() + start >= sizeof address.sun_path) return ENAMETOOLONG;
+  if (bus.name.size() + start >= sizeof address.sun_path) return failure(ENAMETOOLONG);
   std::memcpy(&address.sun_path[start], bus.name.data(), bus.name.size());
   // The length marks the end of an abstract name; a file path ends with a NUL. Either way it takes
   // one byte more than the name.
   const std::size_t length = offsetof(sockaddr_un, sun_path) + bus.name.size() + 1;
   UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
-  if (!fd) return errno;
+  if (!fd) return failure(errno);
   const auto* generic = reinterpret_cast<const sockaddr*>(&address);
-  if (::connect(fd.get(), generic, static_cast<socklen_t>(length)) != 0) return errno;
+  if (::connect(fd.get(), generic, static_cast<socklen_t>(length)) != 0) {
+    return failure(errno);
+  }
   return fd;
 }
 
@@ -52,37 +52,36 @@ std::variant<UniqueFd, int> connectTo(const BusSocket& bus) {
 BusConnector::BusConnector(std::string busName)
     : busName_(std::move(busName)), input_(dbus::kMaxMessageBytes) {}
 
-std::variant<BusSession, ConnectionOpenError> BusConnector::connect(const std::string& address) {
+Result<BusSession, ConnectionOpenError> BusConnector::connect(const std::string& address) {
   // One deadline for all steps: a bus that answers each of them slowly must not hold up the start
   // either.
   deadline_ = std::chrono::steady_clock::now() + kBusTimeout;
-  if (Failure failure = connectToFirst(address)) return *std::move(failure);
-  if (Failure failure = authenticate()) return *std::move(failure);
-  const auto ignore = [](const Value&) -> Failure { return std::nullopt; };
-  if (Failure failure = call("Hello", "", {}, "s", ignore)) return *std::move(failure);
+  if (Outcome done = connectToFirst(address); !done) return std::move(done).error();
+  if (Outcome done = authenticate(); !done) return std::move(done).error();
+  const auto ignore = [](const Value&) -> Outcome { return {}; };
+  if (Outcome done = call("Hello", "", {}, "s", ignore); !done) return std::move(done).error();
   const std::array rule = {Value(kVanishingNames)};
   // Before the name: once it is ours, a sender can call and leave, and its end must not be missed.
-  if (Failure failure = call("AddMatch", "s", rule, "", ignore)) return *std::move(failure);
-  if (Failure failure = requestName()) return *std::move(failure);
+  if (Outcome done = call("AddMatch", "s", rule, "", ignore); !done) return std::move(done).error();
+  if (Outcome done = requestName(); !done) return std::move(done).error();
   const std::span<const std::byte> rest = input_.unused();
   // Requests may have come right after the name was ours.
   kept_.insert(kept_.end(), rest.begin(), rest.end());
   return BusSession{.fd = std::move(fd_), .unused = std::move(kept_), .lastSerial = lastSerial_};
 }
 
-BusConnector::Failure BusConnector::connectToFirst(const std::string& address) {
+BusConnector::Outcome BusConnector::connectToFirst(const std::string& address) {
   address_ = address;
   std::string reasons;
   // An address may list several sockets, of which the first that accepts is the bus. All reasons
   // are in the error, because any of them may be the cause.
   for (const BusSocket& socket : parseBusAddress(address)) {
-    std::variant<UniqueFd, int> result = connectTo(socket);
-    if (auto* fd = std::get_if<UniqueFd>(&result); fd != nullptr) {
-      fd_ = std::move(*fd);
-      return std::nullopt;
+    Result<UniqueFd> connected = connectTo(socket);
+    if (connected) {
+      fd_ = *std::move(connected);
+      return {};
     }
-    reasons +=
-        (reasons.empty() ? "" : "; ") + socket.name + ": " + errnoText(std::get<int>(result));
+    reasons += (reasons.empty() ? "" : "; ") + connected.error().message;
   }
   return unreachable(
       reasons.empty()
@@ -90,14 +89,14 @@ BusConnector::Failure BusConnector::connectToFirst(const std::string& address) {
           : reasons);
 }
 
-BusConnector::Failure BusConnector::authenticate() {
+BusConnector::Outcome BusConnector::authenticate() {
   dbus::ClientHandshake handshake(geteuid());
   std::string output;
   handshake.start(output);
   while (true) {
-    if (Failure failure = send(output)) return failure;
+    if (Outcome done = send(output); !done) return done;
     output.clear();
-    if (Failure failure = receive()) return failure;
+    if (Outcome done = receive(); !done) return done;
     const dbus::HandshakeProgress progress = handshake.feed(input_.unused(), output);
     input_.consume(progress.consumedBytes);
     input_.settle();
@@ -113,22 +112,22 @@ BusConnector::Failure BusConnector::authenticate() {
   }
 }
 
-BusConnector::Failure BusConnector::requestName() {
+BusConnector::Outcome BusConnector::requestName() {
   const std::array arguments = {Value(busName_), Value(kDoNotQueue)};
-  return call("RequestName", "su", arguments, "u", [this](const Value& answer) -> Failure {
+  return call("RequestName", "su", arguments, "u", [this](const Value& answer) -> Outcome {
     const std::uint64_t owner = answer.toUInt64();
-    if (owner == kPrimaryOwner || owner == kAlreadyOwner) return std::nullopt;
-    return ConnectionOpenError{.kind = Kind::kBusNameTaken,
-                               .description = "bus " + address_ +
-                                              ": another process owns the name " + busName_ +
-                                              "; stop it or change listener.bus"};
+    if (owner == kPrimaryOwner || owner == kAlreadyOwner) return {};
+    return Failure<ConnectionOpenError>{.code = ConnectionOpenError::kBusNameTaken,
+                                        .message = "bus " + address_ +
+                                                   ": another process owns the name " + busName_ +
+                                                   "; stop it or change listener.bus"};
   });
 }
 
-BusConnector::Failure BusConnector::call(std::string_view member, std::string_view signature,
+BusConnector::Outcome BusConnector::call(std::string_view member, std::string_view signature,
                                          std::span<const Value> arguments,
                                          std::string_view answerSignature,
-                                         const std::function<Failure(const Value&)>& take) {
+                                         const std::function<Outcome(const Value&)>& take) {
   const dbus::CallTarget target{.destination = bus_names::kBus,
                                 .path = bus_names::kBusPath,
                                 .interface = bus_names::kBus,
@@ -137,12 +136,10 @@ BusConnector::Failure BusConnector::call(std::string_view member, std::string_vi
   if (!dbus::appendMethodCall(bytes, ++lastSerial_, target, signature, arguments)) {
     return unreachable("cannot encode the call of " + std::string(member));
   }
-  if (Failure failure = send(bytes)) return failure;
-  std::variant<dbus::Frame, ConnectionOpenError> answer = waitForAnswer(lastSerial_);
-  if (auto* failure = std::get_if<ConnectionOpenError>(&answer); failure != nullptr) {
-    return std::move(*failure);
-  }
-  const dbus::Frame& frame = std::get<dbus::Frame>(answer);
+  if (Outcome done = send(bytes); !done) return done;
+  auto answer = waitForAnswer(lastSerial_);
+  if (!answer) return std::move(answer).error();
+  const dbus::Frame& frame = *answer;
   if (frame.header.type == dbus::MessageType::kError) {
     return unreachable(std::string(member) + " failed with " + std::string(frame.header.errorName));
   }
@@ -155,12 +152,12 @@ BusConnector::Failure BusConnector::call(std::string_view member, std::string_vi
   return take(values.empty() ? Value() : values.front());
 }
 
-std::variant<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::uint32_t serial) {
+Result<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::uint32_t serial) {
   while (true) {
     const FrameBuffer::Next next = input_.next();
     if (next.state == FrameBuffer::State::kBroken) return unreachable(next.error.message);
     if (next.state != FrameBuffer::State::kFrame) {
-      if (Failure failure = receive()) return *std::move(failure);
+      if (Outcome done = receive(); !done) return std::move(done).error();
       input_.settle();
       continue;
     }
@@ -178,7 +175,7 @@ std::variant<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::
   }
 }
 
-BusConnector::Failure BusConnector::send(std::string_view bytes) {
+BusConnector::Outcome BusConnector::send(std::string_view bytes) {
   while (!bytes.empty()) {
     const ssize_t count = ::send(fd_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
     if (count >= 0) {
@@ -189,10 +186,10 @@ BusConnector::Failure BusConnector::send(std::string_view bytes) {
       return unreachable("no answer within 5 seconds");
     }
   }
-  return std::nullopt;
+  return {};
 }
 
-BusConnector::Failure BusConnector::receive() {
+BusConnector::Outcome BusConnector::receive() {
   if (!waitFor(POLLIN)) return unreachable("no answer within 5 seconds");
   const std::span<std::byte> room = input_.readInto(scratch_);
   const ssize_t count = read(fd_.get(), room.data(), room.size());
@@ -200,7 +197,7 @@ BusConnector::Failure BusConnector::receive() {
   input_.received(count > 0 ? static_cast<std::size_t>(count) : 0);
   if (count == 0) return unreachable("the bus closed the connection");
   if (count < 0 && error != EAGAIN && error != EINTR) return unreachable(errnoText(error));
-  return std::nullopt;
+  return {};
 }
 
 bool BusConnector::waitFor(short events) const {
@@ -212,8 +209,8 @@ bool BusConnector::waitFor(short events) const {
   return result > 0 || (result < 0 && errno == EINTR);
 }
 
-ConnectionOpenError BusConnector::unreachable(const std::string& why) const {
-  return {.kind = Kind::kBusUnreachable, .description = "bus " + address_ + ": " + why};
+Failure<ConnectionOpenError> BusConnector::unreachable(const std::string& why) const {
+  return {.code = ConnectionOpenError::kBusUnreachable, .message = "bus " + address_ + ": " + why};
 }
 
 }  // namespace halvox::platform::linux_

@@ -5,13 +5,12 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
-#include <variant>
 #include <vector>
 
+#include "platform/linux/base/Result.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/BusAddress.h"
 #include "platform/linux/connection/FrameBuffer.h"
@@ -36,24 +35,24 @@ class BusConnector {
   BusConnector(const BusConnector&) = delete;
   BusConnector& operator=(const BusConnector&) = delete;
 
-  std::variant<BusSession, ConnectionOpenError> connect(const std::string& address);
+  Result<BusSession, ConnectionOpenError> connect(const std::string& address);
 
  private:
-  using Failure = std::optional<ConnectionOpenError>;
+  using Outcome = Result<void, ConnectionOpenError>;
 
-  Failure connectToFirst(const std::string& address);
-  Failure authenticate();
-  Failure requestName();
+  Outcome connectToFirst(const std::string& address);
+  Outcome authenticate();
+  Outcome requestName();
   // Calls a method of the bus and passes the first argument of the answer to `take`.
-  Failure call(std::string_view member, std::string_view signature,
+  Outcome call(std::string_view member, std::string_view signature,
                std::span<const Value> arguments, std::string_view answerSignature,
-               const std::function<Failure(const Value&)>& take);
+               const std::function<Outcome(const Value&)>& take);
   // Waits for the answer to the call with that serial. Keeps all other messages for the session.
-  std::variant<dbus::Frame, ConnectionOpenError> waitForAnswer(std::uint32_t serial);
-  Failure send(std::string_view bytes);
-  Failure receive();
+  Result<dbus::Frame, ConnectionOpenError> waitForAnswer(std::uint32_t serial);
+  Outcome send(std::string_view bytes);
+  Outcome receive();
   [[nodiscard]] bool waitFor(short events) const;
-  [[nodiscard]] ConnectionOpenError unreachable(const std::string& why) const;
+  [[nodiscard]] Failure<ConnectionOpenError> unreachable(const std::string& why) const;
 
   std::string busName_;
   std::string address_;

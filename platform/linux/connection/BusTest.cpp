@@ -172,11 +172,11 @@ TEST_F(BusTest, TakenNameIsAnError) {
   options.signals = EndSignals::kLeaveAlone;
   LinuxConnectionService second(options, backpressure);
 
-  const auto error = second.open();
+  const auto opened = second.open();
 
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->kind, ConnectionOpenError::Kind::kBusNameTaken);
-  EXPECT_THAT(error->description, HasSubstr(kName));
+  ASSERT_FALSE(opened);
+  EXPECT_EQ(opened.error().code, ConnectionOpenError::kBusNameTaken);
+  EXPECT_THAT(opened.error().message, HasSubstr(kName));
 }
 
 TEST_F(BusTest, LossOfTheBusEndsItsSendersAndNothingElse) {
@@ -251,12 +251,12 @@ TEST(BusStartTest, MissingBusIsAnError) {
   setenv("DBUS_SESSION_BUS_ADDRESS", address.c_str(), 1);
   LinuxConnectionService service(options, backpressure);
 
-  const auto error = service.open();
+  const auto opened = service.open();
   unsetenv("DBUS_SESSION_BUS_ADDRESS");
 
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->kind, ConnectionOpenError::Kind::kBusUnreachable);
-  EXPECT_THAT(error->description, HasSubstr("missing"));
+  ASSERT_FALSE(opened);
+  EXPECT_EQ(opened.error().code, ConnectionOpenError::kBusUnreachable);
+  EXPECT_THAT(opened.error().message, HasSubstr("missing"));
 }
 
 }  // namespace

@@ -91,7 +91,9 @@ class LinuxHarness {
   LinuxHarness& operator=(const LinuxHarness&) = delete;
 
   void serve(NSXPCListenerDelegate& delegate) {
-    if (const auto error = service_->open()) throw std::runtime_error(error->description);
+    if (const auto opened = service_->open(); !opened) {
+      throw std::runtime_error(opened.error().message);
+    }
     service_->serviceListener().setDelegate(delegate);
     thread_ = std::thread([this] { service_->serviceListener().resume(); });
   }

@@ -47,9 +47,8 @@ void allowMoreDescriptors() {
   static_cast<void>(setrlimit(RLIMIT_NOFILE, &limit));
 }
 
-ConnectionOpenError systemFailure(const std::string& what) {
-  return {.kind = ConnectionOpenError::Kind::kSystem,
-          .description = what + ": " + errnoText(errno)};
+Failure<ConnectionOpenError> systemFailure(const std::string& what) {
+  return {.code = ConnectionOpenError::kSystem, .message = what + ": " + errnoText(errno)};
 }
 
 }  // namespace
@@ -71,72 +70,70 @@ ConnectionHost::ConnectionHost(ConnectionOptions options, Backpressure& backpres
 
 ConnectionHost::~ConnectionHost() { shutDown(); }
 
-std::optional<ConnectionOpenError> ConnectionHost::open() {
+Result<void, ConnectionOpenError> ConnectionHost::open() {
   statistics_ = std::make_shared<ConnectionStatistics>(platform::statistics());
   dispatcher_ = std::make_unique<RequestDispatcher>(options_, *statistics_, identity_);
   allowMoreDescriptors();
-  if (auto error = openLoop()) return error;
-  if (auto error = openSockets()) return error;
+  if (auto opened = openLoop(); !opened) return opened;
+  if (auto opened = openSockets(); !opened) return opened;
   return openBuses();
 }
 
-std::optional<ConnectionOpenError> ConnectionHost::openLoop() {
+Result<void, ConnectionOpenError> ConnectionHost::openLoop() {
   if (!loop_.isOpen() || !inbox_->watchWith(loop_) || !timer_.open(loop_)) {
     return systemFailure("cannot create the event loop");
   }
-  if (options_.signals == EndSignals::kLeaveAlone) return std::nullopt;
+  if (options_.signals == EndSignals::kLeaveAlone) return {};
   signals_ = std::make_unique<SignalWatch>([this] { stopping_ = true; }, options_.onReportSignal);
   if (!signals_->start(loop_)) return systemFailure("cannot watch the signals");
-  return std::nullopt;
+  return {};
 }
 
-std::optional<ConnectionOpenError> ConnectionHost::openSockets() {
+Result<void, ConnectionOpenError> ConnectionHost::openSockets() {
   // A passed socket and its file belong to systemd. This binds no other one, and removes no file at
   // the end.
-  auto passed = passedSockets();
-  if (auto* error = std::get_if<ConnectionOpenError>(&passed)) return std::move(*error);
-  auto& sockets = std::get<std::vector<UniqueFd>>(passed);
-  if (sockets.empty()) {
+  auto sockets = passedSockets();
+  if (!sockets) return std::move(sockets).error();
+  if (sockets->empty()) {
     if (options_.makeSocketDirectory) makeDirectoryOf(options_.socket, options_.socketAccess);
     auto bound = listenOn(options_.socket, options_.socketAccess);
-    if (auto* error = std::get_if<ConnectionOpenError>(&bound)) return std::move(*error);
-    socketFile_ = std::move(std::get<BoundSocket>(bound).file);
-    sockets.push_back(std::move(std::get<BoundSocket>(bound).fd));
+    if (!bound) return std::move(bound).error();
+    socketFile_ = std::move(bound->file);
+    sockets->push_back(std::move(bound->fd));
   }
-  for (UniqueFd& fd : sockets) {
+  for (UniqueFd& fd : *sockets) {
     listeners_.push_back(std::make_unique<ListeningSocket>(std::move(fd), *this));
     if (!listeners_.back()->start()) return systemFailure("cannot watch the listening socket");
   }
-  return std::nullopt;
+  return {};
 }
 
-std::optional<ConnectionOpenError> ConnectionHost::openBuses() {
+Result<void, ConnectionOpenError> ConnectionHost::openBuses() {
   const std::optional<StarterBus>& starter = options_.starter;
   const bool wantsBus = options_.bus != BusKind::kNone;
   // One bus is joined once: it gives a name to one connection only.
   const bool isStartersBus = wantsBus && starter.has_value() && starter->kind == options_.bus;
   if (wantsBus) {
-    auto error = joinBus(isStartersBus ? starter->address : busAddressOf(options_.bus));
-    if (error) return error;
+    auto joined = joinBus(isStartersBus ? starter->address : busAddressOf(options_.bus));
+    if (!joined) return joined;
   }
-  if (!starter.has_value() || isStartersBus) return std::nullopt;
+  if (!starter.has_value() || isStartersBus) return {};
   // Not the end of the start: a terminal that a bus has started hands the variables on to every
   // program in it, where they may be wrong.
-  if (const auto error = joinBus(starter->address)) {
-    kLog.error("cannot join the bus that started the service: ", error->description,
+  if (const auto joined = joinBus(starter->address); !joined) {
+    kLog.error("cannot join the bus that started the service: ", joined.error().message,
                "; clients reach it through its socket", wantsBus ? " and listener.bus" : "");
   } else {
     kLog.notice("serving the bus that started the service, ", starter->address);
   }
-  return std::nullopt;
+  return {};
 }
 
-std::optional<ConnectionOpenError> ConnectionHost::joinBus(const std::string& address) {
+Result<void, ConnectionOpenError> ConnectionHost::joinBus(const std::string& address) {
   auto connected = BusConnector(options_.busName).connect(address);
-  if (auto* error = std::get_if<ConnectionOpenError>(&connected)) return std::move(*error);
-  buses_.push_back(
-      std::make_unique<BusConnection>(*this, std::move(std::get<BusSession>(connected))));
-  return std::nullopt;
+  if (!connected) return std::move(connected).error();
+  buses_.push_back(std::make_unique<BusConnection>(*this, *std::move(connected)));
+  return {};
 }
 
 void ConnectionHost::resume() {

@@ -48,7 +48,7 @@ class ConnectionHost final : public NSXPCListener {
   ConnectionHost(ConnectionOptions options, Backpressure& backpressure);
   ~ConnectionHost() override;
 
-  [[nodiscard]] std::optional<ConnectionOpenError> open();
+  Result<void, ConnectionOpenError> open();
   void setDelegate(NSXPCListenerDelegate& delegate) override { delegate_ = &delegate; }
   void resume() override;
   void requestStop() { inbox_->postStop(); }
@@ -80,10 +80,10 @@ class ConnectionHost final : public NSXPCListener {
   void peerClosed(PeerConnection& peer);
 
  private:
-  [[nodiscard]] std::optional<ConnectionOpenError> openLoop();
-  [[nodiscard]] std::optional<ConnectionOpenError> openSockets();
-  [[nodiscard]] std::optional<ConnectionOpenError> openBuses();
-  [[nodiscard]] std::optional<ConnectionOpenError> joinBus(const std::string& address);
+  Result<void, ConnectionOpenError> openLoop();
+  Result<void, ConnectionOpenError> openSockets();
+  Result<void, ConnectionOpenError> openBuses();
+  Result<void, ConnectionOpenError> joinBus(const std::string& address);
   void takeTurn();
   void expireDeadlines();
   [[nodiscard]] std::optional<DeadlineQueue::Clock::time_point> firstDeadline() const;

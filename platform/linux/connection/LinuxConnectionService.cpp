@@ -12,7 +12,7 @@ LinuxConnectionService::LinuxConnectionService(ConnectionOptions options,
 
 LinuxConnectionService::~LinuxConnectionService() = default;
 
-std::optional<ConnectionOpenError> LinuxConnectionService::open() { return host_->open(); }
+Result<void, ConnectionOpenError> LinuxConnectionService::open() { return host_->open(); }
 
 NSXPCListener& LinuxConnectionService::serviceListener() { return *host_; }
 

@@ -10,6 +10,7 @@
 #include <string>
 
 #include "platform/connection.h"
+#include "platform/linux/base/Result.h"
 #include "platform/linux/configuration/Configuration.h"
 #include "platform/linux/configuration/Defaults.h"
 #include "platform/linux/connection/BusAddress.h"
@@ -61,23 +62,19 @@ struct ConnectionOptions {
   std::function<void()> onReportSignal;
 };
 
-// Why open() failed.
-struct ConnectionOpenError {
-  enum class Kind : std::uint8_t {
-    kPathTooLong,
-    kDirectoryMissing,
-    kDirectoryNotWritable,
-    kAlreadyServed,  // another process answers on that socket
-    kNotASocket,     // a file of another kind exists at the path
-    kUnknownGroup,   // the socket's group does not exist
-    kNotPermitted,   // the user may not give the file to that group
-    kBadActivation,  // a passed descriptor is not a listening stream socket
-    kBusUnreachable,
-    kBusNameTaken,
-    kSystem,  // any other system error
-  };
-  Kind kind = Kind::kSystem;
-  std::string description;  // one line for the user: the object and the error
+// Why open() failed. The message of the failure is one line for the user.
+enum class ConnectionOpenError : std::uint8_t {
+  kPathTooLong,
+  kDirectoryMissing,
+  kDirectoryNotWritable,
+  kAlreadyServed,  // another process answers on that socket
+  kNotASocket,     // a file of another kind exists at the path
+  kUnknownGroup,   // the socket's group does not exist
+  kNotPermitted,   // the user may not give the file to that group
+  kBadActivation,  // a passed descriptor is not a listening stream socket
+  kBusUnreachable,
+  kBusNameTaken,
+  kSystem,  // any other system error
 };
 
 // Connections over D-Bus: on a Unix socket of the service's own, on a bus if configured, and on the
@@ -105,7 +102,7 @@ class LinuxConnectionService final : public ConnectionService {
   // Makes the socket, or takes the sockets of socket activation, and joins the buses. Replaces a
   // socket file that no process serves any more. Waits at most 5 seconds for each bus. Raises the
   // process's limit of descriptors to the hard limit.
-  [[nodiscard]] std::optional<ConnectionOpenError> open();
+  Result<void, ConnectionOpenError> open();
 
   NSXPCListener& serviceListener() override;
 

@@ -43,7 +43,7 @@ class ProcessTest : public testing::Test {
   ScratchDirectory directory_;
 };
 
-int statusFor(ConnectionOpenError::Kind kind) { return 10 + static_cast<int>(kind); }
+int statusFor(ConnectionOpenError kind) { return 10 + static_cast<int>(kind); }
 
 TEST_F(ProcessTest, EndSignalsEndItInOrder) {
   for (const int number : {SIGTERM, SIGINT}) {
@@ -63,7 +63,7 @@ TEST_F(ProcessTest, SecondServiceIsTurnedAwayAndTheFirstGoesOn) {
 
   TestProcess second(command());
 
-  EXPECT_EQ(second.waitForExit(), statusFor(ConnectionOpenError::Kind::kAlreadyServed));
+  EXPECT_EQ(second.waitForExit(), statusFor(ConnectionOpenError::kAlreadyServed));
   waitForSocket();
 }
 
@@ -88,7 +88,7 @@ std::vector<std::string> activated(const std::vector<std::string>& command) {
 
 TEST_F(ProcessTest, PassedSocketTakesThePlaceOfItsOwn) {
   auto bound = listenOn(socketPath());
-  const BoundSocket& socket = std::get<BoundSocket>(bound);
+  const BoundSocket& socket = *bound;
   RawClient early(socketPath());  // connects before anybody serves
   early.authenticate(early.callWithText("echo", "early"));
   const std::vector<std::string> other = {HALVOX_TEST_SERVER,
@@ -109,7 +109,7 @@ TEST_F(ProcessTest, PassedDescriptorThatDoesNotListenIsRefused) {
 
   TestProcess service(activated(command()), {.passedFd = socket.get()});
 
-  EXPECT_EQ(service.waitForExit(), statusFor(ConnectionOpenError::Kind::kBadActivation));
+  EXPECT_EQ(service.waitForExit(), statusFor(ConnectionOpenError::kBadActivation));
 }
 
 TEST_F(ProcessTest, ManagerIsNotifiedWhenItServes) {

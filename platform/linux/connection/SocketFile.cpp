@@ -18,10 +18,10 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-using Kind = ConnectionOpenError::Kind;
+using Kind = ConnectionOpenError;
 
-ConnectionOpenError failure(Kind kind, const std::filesystem::path& path, const std::string& why) {
-  return {.kind = kind, .description = "socket " + path.string() + ": " + why};
+Failure<Kind> failure(Kind kind, const std::filesystem::path& path, const std::string& why) {
+  return {.code = kind, .message = "socket " + path.string() + ": " + why};
 }
 
 UniqueFd newSocket() {
@@ -38,10 +38,9 @@ std::optional<sockaddr_un> addressOf(const std::filesystem::path& path) {
 }
 
 // Removes a socket file that no process serves. An error when anything else is at the path.
-std::optional<ConnectionOpenError> clearTheWay(const std::filesystem::path& path,
-                                               const sockaddr_un& address) {
+Result<void, Kind> clearTheWay(const std::filesystem::path& path, const sockaddr_un& address) {
   struct stat status {};
-  if (lstat(path.c_str(), &status) != 0) return std::nullopt;  // bind() reports other problems
+  if (lstat(path.c_str(), &status) != 0) return {};  // bind() reports other problems
   if (!S_ISSOCK(status.st_mode)) {
     return failure(Kind::kNotASocket, path,
                    "a file that is not a socket exists there; remove it or set listener.socket");
@@ -61,10 +60,10 @@ std::optional<ConnectionOpenError> clearTheWay(const std::filesystem::path& path
   }
   // Nobody listens: the service that made it was killed before it could remove it.
   static_cast<void>(unlink(path.c_str()));
-  return std::nullopt;
+  return {};
 }
 
-ConnectionOpenError bindFailure(const std::filesystem::path& path, int error) {
+Failure<Kind> bindFailure(const std::filesystem::path& path, int error) {
   switch (error) {
     case ENOENT:
     case ENOTDIR:
@@ -83,8 +82,8 @@ ConnectionOpenError bindFailure(const std::filesystem::path& path, int error) {
   }
 }
 
-// The ID of the group; none if there is no group of that name; or an errno value.
-std::variant<std::optional<gid_t>, int> findGroup(const std::string& name) {
+// The ID of the group; none if there is no group of that name.
+Result<std::optional<gid_t>> findGroup(const std::string& name) {
   // A group with many members needs a large buffer. 16 MiB end a look-up that always wants more.
   constexpr std::size_t kLargestEntry = std::size_t{1} << 24U;
   group entry{};
@@ -97,28 +96,26 @@ std::variant<std::optional<gid_t>, int> findGroup(const std::string& name) {
   } while (error == EINTR || (error == ERANGE && buffer.size() <= kLargestEntry));
   if (found != nullptr) return found->gr_gid;
   if (error == 0 || error == ENOENT || error == ESRCH) return std::nullopt;
-  return error;
+  return Failure<>{errnoText(error)};
 }
 
-std::optional<ConnectionOpenError> giveToGroup(const std::filesystem::path& path,
-                                               const std::string& name) {
-  const auto looked = findGroup(name);
+Result<void, Kind> giveToGroup(const std::filesystem::path& path, const std::string& name) {
+  const auto id = findGroup(name);
   const std::string quoted = '"' + name + '"';
-  if (const int* error = std::get_if<int>(&looked)) {
+  if (!id) {
     return failure(
         Kind::kSystem, path,
-        "cannot look up the group " + quoted + " of listener.group: " + errnoText(*error));
+        "cannot look up the group " + quoted + " of listener.group: " + id.error().message);
   }
-  const std::optional<gid_t> id = std::get<std::optional<gid_t>>(looked);
-  if (!id.has_value()) {
-    return ConnectionOpenError{
-        .kind = Kind::kUnknownGroup,
-        .description = "listener.group: expected a group of this system, found " + quoted};
+  if (!id->has_value()) {
+    return Failure<Kind>{
+        .code = Kind::kUnknownGroup,
+        .message = "listener.group: expected a group of this system, found " + quoted};
   }
   constexpr uid_t kSameUser = static_cast<uid_t>(-1);
   // The path and not the descriptor: fchown() of a socket does not change its file.
-  if (fchownat(AT_FDCWD, path.c_str(), kSameUser, *id, AT_SYMLINK_NOFOLLOW) == 0) {
-    return std::nullopt;
+  if (fchownat(AT_FDCWD, path.c_str(), kSameUser, **id, AT_SYMLINK_NOFOLLOW) == 0) {
+    return {};
   }
   return failure(errno == EPERM ? Kind::kNotPermitted : Kind::kSystem, path,
                  "cannot give it to the group " + quoted + " of listener.group: " +
@@ -134,15 +131,14 @@ bool closeToOthers(int fd, const SocketAccess& access) {
 }
 
 // Sets the group before the mode: the members of the old group must never get access.
-std::optional<ConnectionOpenError> letIn(const std::filesystem::path& path,
-                                         const SocketAccess& access) {
+Result<void, Kind> letIn(const std::filesystem::path& path, const SocketAccess& access) {
   if (!access.group.empty()) {
-    if (auto error = giveToGroup(path, access.group)) return error;
+    if (auto given = giveToGroup(path, access.group); !given) return given;
   }
   if (chmod(path.c_str(), access.mode) != 0) {
     return failure(Kind::kSystem, path, "cannot set its permissions: " + errnoText(errno));
   }
-  return std::nullopt;
+  return {};
 }
 
 }  // namespace
@@ -178,8 +174,8 @@ void SocketFile::remove() noexcept {
   path_.clear();
 }
 
-std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
-                                                        const SocketAccess& access) {
+Result<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
+                                                  const SocketAccess& access) {
   const std::optional<sockaddr_un> address = addressOf(path);
   if (!address.has_value()) {
     return failure(Kind::kPathTooLong, path,
@@ -187,9 +183,7 @@ std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::p
                        " bytes, found " + std::to_string(path.native().size()) +
                        "; set listener.socket");
   }
-  if (std::optional<ConnectionOpenError> error = clearTheWay(path, *address)) {
-    return *std::move(error);
-  }
+  if (auto cleared = clearTheWay(path, *address); !cleared) return std::move(cleared).error();
   BoundSocket bound{.fd = newSocket(), .file = {}};
   if (!bound.fd) return failure(Kind::kSystem, path, errnoText(errno));
   const auto* generic = reinterpret_cast<const sockaddr*>(&*address);
@@ -199,7 +193,7 @@ std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::p
   if (bind(bound.fd.get(), generic, sizeof *address) != 0) return bindFailure(path, errno);
   // From here on, each failure removes the file again.
   bound.file = SocketFile(path);
-  if (auto error = letIn(path, access)) return *std::move(error);
+  if (auto opened = letIn(path, access); !opened) return std::move(opened).error();
   if (listen(bound.fd.get(), SOMAXCONN) != 0) {
     return failure(Kind::kSystem, path, errnoText(errno));
   }
@@ -214,7 +208,7 @@ void makeDirectoryOf(const std::filesystem::path& path, const SocketAccess& acce
   if ((access.mode & kOthers) != 0) static_cast<void>(chmod(directory.c_str(), 0755));
 }
 
-std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
+Result<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
   std::vector<UniqueFd> sockets;
   // 1: removes the variables, so that programs which the service starts do not take the sockets for
   // theirs.
@@ -223,17 +217,16 @@ std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
     sockets.emplace_back(fd);
     constexpr int kListening = 1;
     if (sd_is_socket_unix(fd, SOCK_STREAM, kListening, nullptr, 0) <= 0) {
-      return ConnectionOpenError{.kind = Kind::kBadActivation,
-                                 .description = "the passed descriptor " + std::to_string(fd) +
-                                                " is not a listening Unix stream socket"};
+      return Failure<Kind>{.code = Kind::kBadActivation,
+                           .message = "the passed descriptor " + std::to_string(fd) +
+                                      " is not a listening Unix stream socket"};
     }
     // systemd passes blocking sockets by default. accept() would hang at an empty backlog.
     static_cast<void>(fcntl(fd, F_SETFL, O_NONBLOCK));
   }
   if (count < 0) {
-    return ConnectionOpenError{
-        .kind = Kind::kBadActivation,
-        .description = "cannot use the passed descriptors: " + errnoText(-count)};
+    return Failure<Kind>{.code = Kind::kBadActivation,
+                         .message = "cannot use the passed descriptors: " + errnoText(-count)};
   }
   return sockets;
 }

@@ -1,12 +1,11 @@
 #pragma once
 
 #include <filesystem>
-#include <optional>
-#include <variant>
 #include <vector>
 
 #include <sys/types.h>
 
+#include "platform/linux/base/Result.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/connection/LinuxConnectionService.h"
 
@@ -40,8 +39,8 @@ struct BoundSocket {
 // Makes the socket at `path`. Users that `access` excludes cannot connect at any time, not even
 // while it is made. Replaces a socket file that no process serves any more, and never any other
 // file. Blocks as long as a connect and a look-up of the group take.
-std::variant<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
-                                                        const SocketAccess& access = {});
+Result<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
+                                                  const SocketAccess& access = {});
 
 // Makes the directory of `path` unless it exists, open to the same users as the socket. listenOn()
 // reports a failure, because it knows whether the directory was needed.
@@ -49,6 +48,6 @@ void makeDirectoryOf(const std::filesystem::path& path, const SocketAccess& acce
 
 // The sockets that systemd passed at the start; empty without socket activation. Later calls return
 // none, and child processes do not inherit them.
-std::variant<std::vector<UniqueFd>, ConnectionOpenError> passedSockets();
+Result<std::vector<UniqueFd>, ConnectionOpenError> passedSockets();
 
 }  // namespace halvox::platform::linux_

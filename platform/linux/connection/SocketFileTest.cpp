@@ -19,7 +19,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-using Kind = ConnectionOpenError::Kind;
+using Kind = ConnectionOpenError;
 using std::filesystem::path;
 
 class SocketFileTest : public testing::Test {
@@ -28,16 +28,15 @@ class SocketFileTest : public testing::Test {
   ScratchDirectory directory_;
 };
 
-Kind kindOf(const std::variant<BoundSocket, ConnectionOpenError>& result) {
-  const auto* error = std::get_if<ConnectionOpenError>(&result);
-  EXPECT_NE(error, nullptr);
-  return error != nullptr ? error->kind : Kind::kSystem;
+Kind kindOf(const Result<BoundSocket, Kind>& result) {
+  EXPECT_FALSE(result);
+  return result ? Kind::kSystem : result.error().code;
 }
 
 TEST_F(SocketFileTest, AnybodyMayConnect) {
   const auto bound = listenOn(socketPath());
 
-  ASSERT_TRUE(std::holds_alternative<BoundSocket>(bound));
+  ASSERT_TRUE(bound);
   const auto permissions = std::filesystem::status(socketPath()).permissions();
   EXPECT_EQ(static_cast<unsigned>(permissions) & 0777U, 0666U);
 }
@@ -48,7 +47,7 @@ TEST_F(SocketFileTest, OnlyThoseMayConnectWhomTheModeLetsIn) {
   const auto bound = listenOn(socketPath(), {.mode = 0640, .group = {}});
 
   umask(before);
-  ASSERT_TRUE(std::holds_alternative<BoundSocket>(bound));
+  ASSERT_TRUE(bound);
   const auto permissions = std::filesystem::status(socketPath()).permissions();
   EXPECT_EQ(static_cast<unsigned>(permissions) & 0777U, 0640U);
 }
@@ -57,8 +56,7 @@ TEST_F(SocketFileTest, UnknownGroupIsAnErrorAndNoFileIsLeft) {
   const auto result = listenOn(socketPath(), {.mode = 0660, .group = "no such group"});
 
   EXPECT_EQ(kindOf(result), Kind::kUnknownGroup);
-  EXPECT_NE(std::get<ConnectionOpenError>(result).description.find("\"no such group\""),
-            std::string::npos);
+  EXPECT_NE(result.error().message.find("\"no such group\""), std::string::npos);
   EXPECT_FALSE(std::filesystem::exists(socketPath()));
 }
 
@@ -89,8 +87,7 @@ TEST_F(SocketFileTest, NobodyWhomTheModeKeepsOutGetsInWhileTheSocketIsMade) {
   const pid_t intruder = startIntruder(socketPath());
 
   for (int round = 0; round < kRounds; ++round) {
-    ASSERT_TRUE(
-        std::holds_alternative<BoundSocket>(listenOn(socketPath(), {.mode = 0600, .group = {}})));
+    ASSERT_TRUE(listenOn(socketPath(), {.mode = 0600, .group = {}}));
   }
 
   umask(before);
@@ -125,10 +122,10 @@ TEST_F(SocketFileTest, SocketOfALiveServiceIsLeftAlone) {
 
 TEST_F(SocketFileTest, SocketThatNobodyServesIsReplaced) {
   auto dead = listenOn(socketPath());
-  std::get<BoundSocket>(dead).fd.reset();
+  dead->fd.reset();
   ASSERT_TRUE(std::filesystem::is_socket(socketPath()));
 
-  EXPECT_TRUE(std::holds_alternative<BoundSocket>(listenOn(socketPath())));
+  EXPECT_TRUE(listenOn(socketPath()));
 }
 
 TEST_F(SocketFileTest, OtherFileIsLeftAlone) {
@@ -151,8 +148,7 @@ TEST_F(SocketFileTest, DirectoryThatCannotBeWrittenIsAnError) {
     constexpr uid_t kNobody = 65534;
     if (geteuid() == 0 && setresuid(kNobody, kNobody, kNobody) != 0) _exit(2);
     const auto result = listenOn(socketPath());
-    const auto* error = std::get_if<ConnectionOpenError>(&result);
-    _exit(error != nullptr && error->kind == Kind::kDirectoryNotWritable ? 0 : 1);
+    _exit(!result && result.error().code == Kind::kDirectoryNotWritable ? 0 : 1);
   }
   int status = 0;
   ASSERT_EQ(waitpid(child, &status, 0), child);

@@ -11,7 +11,9 @@ ServiceUnderTest::ServiceUnderTest(const std::function<void(ConnectionOptions&)>
   options.signals = EndSignals::kLeaveAlone;
   if (configure) configure(options);
   service_.emplace(std::move(options), backpressure);
-  if (const auto error = service_->open()) throw std::runtime_error(error->description);
+  if (const auto opened = service_->open(); !opened) {
+    throw std::runtime_error(opened.error().message);
+  }
   service_->serviceListener().setDelegate(delegate);
   thread_ = std::jthread([this] { service_->serviceListener().resume(); });
 }

@@ -25,10 +25,10 @@ int main(int argc, char** argv) {
   ConnectionOptions options;
   options.socket = argv[1];
   LinuxConnectionService service(options, backpressure);
-  if (const auto error = service.open()) {
-    std::fprintf(stderr, "%s\n", error->description.c_str());
+  if (const auto opened = service.open(); !opened) {
+    std::fprintf(stderr, "%s\n", opened.error().message.c_str());
     constexpr int kFirstStatus = 10;
-    return kFirstStatus + static_cast<int>(error->kind);
+    return kFirstStatus + static_cast<int>(opened.error().code);
   }
   service.serviceListener().setDelegate(delegate);
   service.serviceListener().resume();
