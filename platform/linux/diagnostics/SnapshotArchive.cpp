@@ -60,13 +60,13 @@ SnapshotArchive::~SnapshotArchive() {
   if (isCreated_ && !isKept_) ::unlink(path_.c_str());
 }
 
-SnapshotArchive::Failure SnapshotArchive::open() {
+Result<void> SnapshotArchive::open() {
   // Removes the file of a service that was killed. O_EXCL then makes sure that the new file is
   // ours.
   ::unlink(path_.c_str());
   writer_->file.reset(
       ::open(path_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, kMode));
-  if (!writer_->file) return path_.native() + ": " + errnoText(errno);
+  if (!writer_->file) return Failure<>{path_.native() + ": " + errnoText(errno)};
   isCreated_ = true;
   writer_->handle.reset(archive_write_new());
   archive* const out = writer_->handle.get();
@@ -76,10 +76,10 @@ SnapshotArchive::Failure SnapshotArchive::open() {
       archive_write_open(out, writer_.get(), nullptr, Writer::write, nullptr) != ARCHIVE_OK) {
     return failed();
   }
-  return writeFailure();
+  return written();
 }
 
-SnapshotArchive::Failure SnapshotArchive::add(const std::string& name, std::string_view bytes) {
+Result<void> SnapshotArchive::add(const std::string& name, std::string_view bytes) {
   const Entry entry(archive_entry_new());
   archive_entry_set_pathname(entry.get(), name.c_str());
   archive_entry_set_filetype(entry.get(), AE_IFREG);
@@ -93,34 +93,34 @@ SnapshotArchive::Failure SnapshotArchive::add(const std::string& name, std::stri
     return failed();
   }
   room_ -= std::min<std::uint64_t>(room_, bytes.size());
-  return writeFailure();
+  return written();
 }
 
-SnapshotArchive::Failure SnapshotArchive::finish() {
+Result<void> SnapshotArchive::finish() {
   if (archive_write_close(writer_->handle.get()) != ARCHIVE_OK) return failed();
   writer_->handle.reset();
-  if (Failure failure = writeFailure()) return failure;
+  if (auto done = written(); !done) return done;
   struct stat status {};
   // Before the archive gets its name: after a power cut, one with a name must be complete.
   if (::fsync(writer_->file.get()) != 0 || ::fstat(writer_->file.get(), &status) != 0) {
-    return path_.native() + ": " + errnoText(errno);
+    return Failure<>{path_.native() + ": " + errnoText(errno)};
   }
   size_ = static_cast<std::uint64_t>(status.st_size);
-  return std::nullopt;
+  return {};
 }
 
-SnapshotArchive::Failure SnapshotArchive::writeFailure() const {
-  if (writer_->error == 0) return std::nullopt;
-  return path_.native() + ": " + errnoText(writer_->error);
+Result<void> SnapshotArchive::written() const {
+  if (writer_->error == 0) return {};
+  return Failure<>{path_.native() + ": " + errnoText(writer_->error)};
 }
 
-SnapshotArchive::Failure SnapshotArchive::failed() const {
-  if (Failure failure = writeFailure()) return failure;
+Failure<> SnapshotArchive::failed() const {
+  if (auto done = written(); !done) return std::move(done).error();
   const int error = archive_errno(writer_->handle.get());
   const char* text = archive_error_string(writer_->handle.get());
   // A positive number is an errno; libarchive's own codes are negative.
-  if (error > 0) return path_.native() + ": " + errnoText(error);
-  return path_.native() + ": " + (text == nullptr ? "cannot write the archive" : text);
+  if (error > 0) return {path_.native() + ": " + errnoText(error)};
+  return {path_.native() + ": " + (text == nullptr ? "cannot write the archive" : text)};
 }
 
 }  // namespace halvox::platform::linux_

@@ -51,7 +51,7 @@ SnapshotCollector::SnapshotCollector(const SnapshotRequest& request, const Snaps
 
 // Parts that change quickly come first: they must show the moment of the request. Parts that may
 // take long come last: they can use up the time without costing another part.
-std::optional<std::string> SnapshotCollector::collect() {
+Result<void> SnapshotCollector::collect() {
   addSignature();
   addRequest();
   addProcess();
@@ -60,7 +60,7 @@ std::optional<std::string> SnapshotCollector::collect() {
   addSystem();
   addSound();
   addManifest();
-  return failure_;
+  return result_;
 }
 
 void SnapshotCollector::addSignature() {
@@ -142,7 +142,7 @@ void SnapshotCollector::addSound() {
   asound.failure = tree.failure;
   for (const TreeFile& file : tree.files) {
     if (isOver() || archive_.roomLeft() < file.bytes.size() + kRoomForManifest) break;
-    failure_ = archive_.add("asound/" + file.path.generic_string(), file.bytes);
+    result_ = archive_.add("asound/" + file.path.generic_string(), file.bytes);
     asound.bytes += file.bytes;
   }
   if (asound.failure.empty() && tree.files.empty()) asound.failure = "the directory has no files";
@@ -155,10 +155,10 @@ void SnapshotCollector::addSound() {
 
 void SnapshotCollector::addManifest() {
   if (isOver()) return;
-  failure_ = archive_.add("manifest.json", json({{"version", 1},
-                                                 {"time", request_.time},
-                                                 {"seconds", secondsOf(Clock::now() - begun_)},
-                                                 {"items", Array(items_)}}));
+  result_ = archive_.add("manifest.json", json({{"version", 1},
+                                                {"time", request_.time},
+                                                {"seconds", secondsOf(Clock::now() - begun_)},
+                                                {"items", Array(items_)}}));
 }
 
 void SnapshotCollector::addPart(const char* name, const std::function<Finding()>& find) {
@@ -167,14 +167,14 @@ void SnapshotCollector::addPart(const char* name, const std::function<Finding()>
   Finding finding = deadline_.hasPassed() ? Finding::failed("the time limit was reached") : find();
   // A capture that the end of the service cuts short is dropped as a whole.
   if (deadline_.stop().isRaised()) {
-    failure_ = "the service is ending";
+    result_ = Failure<>{"the service is ending"};
     return;
   }
   // The manifest must fit in the end, or nobody would know what is missing.
   if (finding.isCollected() && archive_.roomLeft() < finding.bytes.size() + kRoomForManifest) {
     finding = Finding::failed("the size limit of the archive was reached");
   }
-  if (finding.isCollected()) failure_ = archive_.add(name, finding.bytes);
+  if (finding.isCollected()) result_ = archive_.add(name, finding.bytes);
   note(name, finding, Clock::now() - begun);
 }
 

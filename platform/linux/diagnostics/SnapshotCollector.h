@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "platform/diagnostic_reporter.h"
+#include "platform/linux/base/Result.h"
 #include "platform/linux/diagnostics/BoundedFile.h"
 #include "platform/linux/diagnostics/SnapshotArchive.h"
 #include "platform/linux/diagnostics/SystemFacts.h"
@@ -47,8 +48,8 @@ class SnapshotCollector {
                     SnapshotArchive& archive, const Deadline& deadline);
 
   // Collects all parts; call it once. Collects until the deadline at most, but may block longer on
-  // the disk. Returns an error when the archive cannot be written or the service is ending.
-  [[nodiscard]] std::optional<std::string> collect();
+  // the disk. Fails when the archive cannot be written or the service is ending.
+  Result<void> collect();
 
  private:
   using Clock = Deadline::Clock;
@@ -66,7 +67,7 @@ class SnapshotCollector {
   [[nodiscard]] Finding findState();
   [[nodiscard]] Finding findProcess();
   [[nodiscard]] std::string json(const Dictionary& dictionary);
-  [[nodiscard]] bool isOver() const { return failure_.has_value(); }
+  [[nodiscard]] bool isOver() const { return !result_; }
 
   const SnapshotRequest& request_;
   const SnapshotSources& sources_;
@@ -75,7 +76,7 @@ class SnapshotCollector {
   const Clock::time_point begun_ = Clock::now();
   PayloadEncoder encoder_;
   std::vector<Value> items_;  // the entries of the manifest
-  std::optional<std::string> failure_;
+  Result<void> result_;
 };
 
 }  // namespace halvox::platform::linux_

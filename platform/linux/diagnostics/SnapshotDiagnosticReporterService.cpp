@@ -27,11 +27,10 @@ constexpr int kNiceness = 10;
 constexpr const char* kBusy = "another snapshot is being taken";
 constexpr const char* kEnding = "the service is ending";
 
-// The result of one request: a file, or the reason why there is none.
-struct Outcome {
-  std::filesystem::path path{};
-  std::uint64_t size = 0;
-  std::string failure{};
+// A snapshot that was taken.
+struct Snapshot {
+  std::filesystem::path path;
+  std::uint64_t size;
 };
 
 Dictionary errorReply(const std::string& why) { return {{"error", why}}; }
@@ -78,9 +77,9 @@ class SnapshotDiagnosticReporterService::Worker {
   Taken tryTake(Work& work);
   void run();
   void carryOut(const Work& work);
-  [[nodiscard]] Outcome capture(const SnapshotRequest& request);
-  [[nodiscard]] Dictionary conclude(const SnapshotRequest& request, const Outcome& outcome,
-                                    double seconds);
+  Result<Snapshot> capture(const SnapshotRequest& request);
+  [[nodiscard]] Dictionary conclude(const SnapshotRequest& request,
+                                    const Result<Snapshot>& snapshot, double seconds);
 
   const SnapshotOptions options_;
   const SnapshotPartners partners_;
@@ -164,9 +163,9 @@ void SnapshotDiagnosticReporterService::Worker::run() {
 
 void SnapshotDiagnosticReporterService::Worker::carryOut(const Work& work) {
   const auto begun = std::chrono::steady_clock::now();
-  const Outcome outcome = capture(work.request);
+  const Result<Snapshot> snapshot = capture(work.request);
   const std::chrono::duration<double> took = std::chrono::steady_clock::now() - begun;
-  const Dictionary response = conclude(work.request, outcome, took.count());
+  const Dictionary response = conclude(work.request, snapshot, took.count());
   {
     // Reset before the reply: its receiver may request the next snapshot at once.
     const MutexLock lock(mutex_);
@@ -175,8 +174,9 @@ void SnapshotDiagnosticReporterService::Worker::carryOut(const Work& work) {
   work.reply(response);
 }
 
-Outcome SnapshotDiagnosticReporterService::Worker::capture(const SnapshotRequest& request) {
-  if (auto made = directory_.prepare(); !made) return {.failure = std::move(made).error().message};
+Result<Snapshot> SnapshotDiagnosticReporterService::Worker::capture(
+    const SnapshotRequest& request) {
+  if (auto made = directory_.prepare(); !made) return std::move(made).error();
   SnapshotSources sources{.paths = options_.paths,
                           .log = partners_.keptLines,
                           .state = {},
@@ -189,34 +189,34 @@ Outcome SnapshotDiagnosticReporterService::Worker::capture(const SnapshotRequest
   }
   const Deadline deadline(stop_, std::chrono::steady_clock::now() + options_.collectWithin);
   SnapshotArchive archive(directory_.temporaryPath(), options_.mostBytes);
-  if (auto failure = archive.open()) return {.failure = std::move(*failure)};
+  if (auto opened = archive.open(); !opened) return std::move(opened).error();
   SnapshotCollector collector(request, sources, archive, deadline);
-  if (auto failure = collector.collect()) return {.failure = std::move(*failure)};
-  if (auto failure = archive.finish()) return {.failure = std::move(*failure)};
+  if (auto collected = collector.collect(); !collected) return std::move(collected).error();
+  if (auto finished = archive.finish(); !finished) return std::move(finished).error();
   auto published = directory_.publish(request.time, textOf(request.signature, signature_key::kType),
                                       textOf(request.signature, signature_key::kSubType));
-  if (!published) return {.failure = std::move(published).error().message};
+  if (!published) return std::move(published).error();
   archive.keep();
-  return {.path = *std::move(published), .size = archive.size()};
+  return Snapshot{.path = *std::move(published), .size = archive.size()};
 }
 
 Dictionary SnapshotDiagnosticReporterService::Worker::conclude(const SnapshotRequest& request,
-                                                               const Outcome& outcome,
+                                                               const Result<Snapshot>& snapshot,
                                                                double seconds) {
-  if (!outcome.failure.empty()) {
+  if (!snapshot) {
     (stop_.isRaised() ? ending_ : failed_).add();
-    if (errorLines_.tryPass()) log_.error("cannot take a snapshot: ", outcome.failure);
-    return errorReply(outcome.failure);
+    if (errorLines_.tryPass()) log_.error("cannot take a snapshot: ", snapshot.error().message);
+    return errorReply(snapshot.error().message);
   }
   // After the new one has its name: a capture that fails must not cost an old one.
-  directory_.keepNewest(options_.keep, outcome.path);
+  directory_.keepNewest(options_.keep, snapshot->path);
   // After the file has its name: a record must not name a file that does not exist.
   if (partners_.recorder != nullptr) {
-    partners_.recorder->recordSnapshot(request.time, request.signature, outcome.path);
+    partners_.recorder->recordSnapshot(request.time, request.signature, snapshot->path);
   }
   delivered_.add();
-  log_.notice("snapshot taken: ", outcome.path.native(), ", ", outcome.size, " bytes");
-  return {{"path", outcome.path.native()}, {"size_bytes", outcome.size}, {"seconds", seconds}};
+  log_.notice("snapshot taken: ", snapshot->path.native(), ", ", snapshot->size, " bytes");
+  return {{"path", snapshot->path.native()}, {"size_bytes", snapshot->size}, {"seconds", seconds}};
 }
 
 // Makes signatures, and passes requests to the worker, which it keeps alive.
