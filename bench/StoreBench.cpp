@@ -71,7 +71,9 @@ struct Bench {
     store = std::make_unique<SqliteStore>(
         StoreOptions{.directory = directory, .maxMegabytes = maxMegabytes},
         SqliteStore::Environment{clock, statistics, backpressure});
-    if (const auto error = store->open()) throw std::runtime_error(error->description);
+    if (const auto opened = store->open(); !opened) {
+      throw std::runtime_error(opened.error().message);
+    }
     service = std::make_unique<SqliteAnalyticsService>(*store, clock);
   }
   ~Bench() {

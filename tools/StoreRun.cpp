@@ -13,6 +13,7 @@ namespace halvox::tools {
 namespace {
 
 using platform::linux_::EventFollower;
+using platform::linux_::Failure;
 using platform::linux_::RecordFilter;
 using platform::linux_::StoreError;
 using platform::linux_::StoreReader;
@@ -37,9 +38,9 @@ std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& r
                                                  " or the directory that has one");
 }
 
-ExitStatus cannotRead(const StoreRun& run, const StoreError& error) {
+ExitStatus cannotRead(const StoreRun& run, const Failure<StoreError>& failure) {
   return Complaint(run.command, run.form, run.out, run.errors)(ExitStatus::kNoService,
-                                                               error.description, "no-store");
+                                                               failure.message, "no-store");
 }
 
 // Waits for the next records. Returns false when the output is closed.
@@ -56,12 +57,14 @@ bool waitForRecords(int storeDescriptor, int outputDescriptor) {
 ExitStatus follow(const StoreRun& run, const std::filesystem::path& directory,
                   const RecordFilter& filter, const StoreReading& reading) {
   EventFollower follower;
-  if (const auto error = follower.open(directory, filter)) return cannotRead(run, *error);
+  if (const auto opened = follower.open(directory, filter); !opened) {
+    return cannotRead(run, opened.error());
+  }
   do {
-    const auto error = reading.added(follower);
+    const auto delivered = reading.added(follower);
     // After each batch, so that a reader of the pipe sees records at once.
     run.out << std::flush;
-    if (error) return cannotRead(run, *error);
+    if (!delivered) return cannotRead(run, delivered.error());
   } while (run.out && waitForRecords(follower.descriptor(), run.outputDescriptor));
   return ExitStatus::kDone;
 }
@@ -86,10 +89,10 @@ ExitStatus runOverStore(const StoreRun& run, const RecordFilter& filter,
   if (run.selection.follow) return follow(run, path, filter, reading);
 
   StoreReader reader;
-  if (const auto error = reader.open(path)) return cannotRead(run, *error);
-  const auto error = reading.all(reader, filter);
+  if (const auto opened = reader.open(path); !opened) return cannotRead(run, opened.error());
+  const auto read = reading.all(reader, filter);
   run.out << std::flush;
-  return error ? cannotRead(run, *error) : ExitStatus::kDone;
+  return read ? ExitStatus::kDone : cannotRead(run, read.error());
 }
 
 }  // namespace halvox::tools

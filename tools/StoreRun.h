@@ -35,9 +35,9 @@ struct StoreRun {
 
 // Reads and prints records: `all` those of a filter, `added` those that have come since.
 struct StoreReading {
-  using Error = std::optional<platform::linux_::StoreError>;
-  std::function<Error(platform::linux_::StoreReader&, const platform::linux_::RecordFilter&)> all;
-  std::function<Error(platform::linux_::EventFollower&)> added;
+  using Outcome = platform::linux_::Result<void, platform::linux_::StoreError>;
+  std::function<Outcome(platform::linux_::StoreReader&, const platform::linux_::RecordFilter&)> all;
+  std::function<Outcome(platform::linux_::EventFollower&)> added;
 };
 
 // Converts a selection to the filter of the store's reader.

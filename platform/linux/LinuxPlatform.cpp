@@ -79,9 +79,7 @@ std::optional<StartFailure> LinuxPlatform::open() {
     return StartFailure{EX_CONFIG, "link.backend = \"nats\" needs " + adapters_->natsFailure};
   }
   // The store before the sockets: whatever is accepted can then be kept.
-  if (const auto error = adapters_->store.open()) {
-    return startFailure(*error);
-  }
+  if (const auto opened = adapters_->store.open(); !opened) return startFailure(opened.error());
   // After the store, whose lock shows that no other service uses the directory: what is removed
   // here could be in use.
   adapters_->diagnosticReporters.removeLeftovers();

@@ -8,17 +8,17 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-int exitStatus(StoreError::Kind kind) {
-  switch (kind) {
-    case StoreError::Kind::kDirectory:
+int exitStatus(StoreError error) {
+  switch (error) {
+    case StoreError::kDirectory:
       return EX_CANTCREAT;
-    case StoreError::Kind::kInUse:
+    case StoreError::kInUse:
       return EX_UNAVAILABLE;
-    case StoreError::Kind::kNewerVersion:
+    case StoreError::kNewerVersion:
       return EX_DATAERR;
-    case StoreError::Kind::kMissing:
-    case StoreError::Kind::kDamaged:
-    case StoreError::Kind::kCannotOpen:
+    case StoreError::kMissing:
+    case StoreError::kDamaged:
+    case StoreError::kCannotOpen:
       return EX_IOERR;
   }
   return EX_SOFTWARE;
@@ -49,8 +49,8 @@ int exitStatus(ConnectionOpenError error) {
 
 }  // namespace
 
-StartFailure startFailure(const StoreError& error) {
-  return {exitStatus(error.kind), error.description};
+StartFailure startFailure(const Failure<StoreError>& failure) {
+  return {exitStatus(failure.code), failure.message};
 }
 
 StartFailure startFailure(const Failure<ConnectionOpenError>& failure) {

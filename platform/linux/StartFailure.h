@@ -8,7 +8,7 @@
 namespace halvox::platform::linux_ {
 
 enum class ConnectionOpenError : std::uint8_t;
-struct StoreError;
+enum class StoreError : std::uint8_t;
 
 // Why the service cannot start: one line for the user, and an exit status of sysexits.h, by which
 // scripts distinguish the kinds of reasons.
@@ -17,7 +17,7 @@ struct StartFailure {
   std::string description;
 };
 
-[[nodiscard]] StartFailure startFailure(const StoreError& error);
+[[nodiscard]] StartFailure startFailure(const Failure<StoreError>& failure);
 [[nodiscard]] StartFailure startFailure(const Failure<ConnectionOpenError>& failure);
 
 }  // namespace halvox::platform::linux_

@@ -30,7 +30,9 @@ class OpenStore {
     store_ = std::make_unique<linux_::SqliteStore>(
         options,
         linux_::SqliteStore::Environment{platform_.clock, platform_.statistics, backpressure_});
-    if (const auto error = store_->open()) throw std::runtime_error(error->description);
+    if (const auto opened = store_->open(); !opened) {
+      throw std::runtime_error(opened.error().message);
+    }
   }
 
   linux_::SqliteStore& store() { return *store_; }

@@ -56,11 +56,11 @@ SqliteStore::SqliteStore(const StoreOptions& options, const Environment& environ
                   .databaseBytes = sizes_.databaseBytes,
                   .transactionBytes = sizes_.transactionBytes}) {}
 
-std::optional<StoreError> SqliteStore::open() {
+Result<void, StoreError> SqliteStore::open() {
   configureLibrary();
-  if (auto error = openDatabase()) return error;
+  if (auto opened = openDatabase(); !opened) return opened;
   writer_ = std::thread([this] { run(); });
-  return std::nullopt;
+  return {};
 }
 
 void SqliteStore::close() {
@@ -111,10 +111,9 @@ bool SqliteStore::makeReady() {
                ": the database file was removed or replaced; opening the one that is there now");
     abandonDatabase();
   }
-  const auto error = openDatabase();
-  if (!error.has_value()) return true;
-  drop(DropReason::kInputOutput, error->description);
-  return false;
+  const auto opened = openDatabase();
+  if (!opened) drop(DropReason::kInputOutput, opened.error().message);
+  return opened.has_value();
 }
 
 // SQLite can reuse its write-ahead log from the beginning only when no reader needs an older state
@@ -136,25 +135,24 @@ bool SqliteStore::logHasRoom() {
   return false;
 }
 
-std::optional<StoreError> SqliteStore::openDatabase() {
+Result<void, StoreError> SqliteStore::openDatabase() {
   // An orderly close removes the log. One that exists was left by a run that was killed, or that
   // ended before it had checked the database.
   // Before the database is opened, which makes a log.
   bool mustCheck = files_.logBytes() > 0;
-  if (auto error = openStoreDatabase(files_, sizes_, database_)) return error;
+  if (auto opened = openStoreDatabase(files_, sizes_, database_); !opened) return opened;
   SqliteCode code = useDatabase();
   // Reading the newest records may already have found what the check would look for.
   if (meansDamage(code)) {
     mustCheck = false;
-    std::string newName;
-    if (auto error = beginAnew(database_.errorText(), newName)) return error;
+    if (auto begun = beginAnew(database_.errorText()); !begun) return std::move(begun).error();
     code = useDatabase();
   }
   if (code != SQLITE_OK) return cannotRead();
   if (mustCheck) {
     check_.begin(files_.database(), extent_, [this] { queue_.requestRound(); });
   }
-  return std::nullopt;
+  return {};
 }
 
 SqliteCode SqliteStore::useDatabase() {
@@ -164,21 +162,25 @@ SqliteCode SqliteStore::useDatabase() {
 }
 
 // Why useDatabase() failed. Closes the database.
-StoreError SqliteStore::cannotRead() {
-  StoreError error{
-      StoreError::Kind::kCannotOpen,
+Failure<StoreError> SqliteStore::cannotRead() {
+  Failure<StoreError> failure{
+      StoreError::kCannotOpen,
       files_.database().native() + ": cannot read the database: " + database_.errorText()};
   abandonDatabase();
-  return error;
+  return failure;
 }
 
-// Renames the damaged database and opens a new one.
-std::optional<StoreError> SqliteStore::beginAnew(const std::string& finding, std::string& newName) {
+// Renames the damaged database and opens a new one. Returns the new name of the damaged one.
+Result<std::string, StoreError> SqliteStore::beginAnew(const std::string& finding) {
   abandonDatabase();
-  if (auto error = files_.setAside(newName)) return error;
-  kLog.error("the database is damaged: ", finding, "; it was set aside as ", newName,
+  auto newName = files_.setAside();
+  if (!newName) return newName;
+  kLog.error("the database is damaged: ", finding, "; it was set aside as ", *newName,
              ", and a new database takes its place");
-  return openStoreDatabase(files_, sizes_, database_);
+  if (auto opened = openStoreDatabase(files_, sizes_, database_); !opened) {
+    return std::move(opened).error();
+  }
+  return newName;
 }
 
 // Begins a new database. Copies the records of this run, which are newer than `extent_`, into it.
@@ -186,17 +188,17 @@ std::optional<StoreError> SqliteStore::beginAnew(const std::string& finding, std
 void SqliteStore::replaceDamaged(const std::string& finding) {
   // A copy, because useDatabase() below reads that of the new database.
   const StoreExtent extent = extent_;
-  std::string newName;
-  if (const auto error = beginAnew(finding, newName)) return kLog.error("", error->description);
+  const auto newName = beginAnew(finding);
+  if (!newName) return kLog.error("", newName.error().message);
   std::string problem;
-  const std::uint64_t kept = copyRecordsAfter(extent, newName, database_, problem);
+  const std::uint64_t kept = copyRecordsAfter(extent, *newName, database_, problem);
   kLog.notice("copied the ", kept, " records that were stored since the start to the new database");
   if (!problem.empty()) {
     kLog.error("cannot copy all records that were stored since the start; the others are only in ",
-               newName, ": ", problem);
+               *newName, ": ", problem);
   }
   // After the copy, so that numbering continues after the copied records.
-  if (useDatabase() != SQLITE_OK) kLog.error("", cannotRead().description);
+  if (useDatabase() != SQLITE_OK) kLog.error("", cannotRead().message);
 }
 
 SqliteCode SqliteStore::prepareStatements() {

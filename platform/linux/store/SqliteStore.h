@@ -69,7 +69,7 @@ class SqliteStore {
 
   // Opens the database and starts the writer, or returns why it could not. Call it once. Blocks on
   // the disk.
-  [[nodiscard]] std::optional<StoreError> open();
+  Result<void, StoreError> open();
   // Writes the waiting records, copies the write-ahead log into the database and ends the writer.
   // Later records are dropped and counted. Blocks until the writer has ended. Idempotent.
   void close();
@@ -93,11 +93,10 @@ class SqliteStore {
   [[nodiscard]] bool makeReady();
   [[nodiscard]] bool logHasRoom();
   [[nodiscard]] SqliteCode writeTransaction();
-  [[nodiscard]] std::optional<StoreError> openDatabase();
+  Result<void, StoreError> openDatabase();
   [[nodiscard]] SqliteCode useDatabase();
-  [[nodiscard]] StoreError cannotRead();
-  [[nodiscard]] std::optional<StoreError> beginAnew(const std::string& finding,
-                                                    std::string& newName);
+  [[nodiscard]] Failure<StoreError> cannotRead();
+  Result<std::string, StoreError> beginAnew(const std::string& finding);
   [[nodiscard]] SqliteCode prepareStatements();
   void replaceDamaged(const std::string& finding);
   void releaseStatements();

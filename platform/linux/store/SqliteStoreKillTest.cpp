@@ -35,7 +35,7 @@ class SqliteStoreKillTest : public StoreFixture {
   ~SqliteStoreKillTest() override { ::munmap(progress_, sizeof(Progress)); }
 
   [[noreturn]] void sendUntilKilled() {
-    if (open().has_value()) ::_exit(1);
+    if (!open()) ::_exit(1);
     for (std::size_t number = 0; number < kMostEvents; ++number) {
       send(static_cast<std::int64_t>(number));
       progress_->times[number] = Clock::now();

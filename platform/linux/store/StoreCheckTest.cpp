@@ -246,7 +246,7 @@ TEST_F(StoreCheckTest, FindsADamagedTableOfNames) {
 TEST_F(StoreCheckTest, StopsInTheMiddleWhenTheStoreCloses) {
   leaveKilledStore();
   for (int run = 0; run < 20; ++run) {
-    ASSERT_EQ(open(), std::nullopt);
+    ASSERT_TRUE(open());
     stop();
     writeFile(database().native() + "-wal", std::string(32, '\0'));
   }

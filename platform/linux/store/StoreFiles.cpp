@@ -24,9 +24,9 @@ constexpr mode_t kFileMode = 0640;
 // ends the search in a directory full of such files. The rename then replaces the last one tried.
 constexpr int kMostNamesTried = 100;
 
-StoreError failure(StoreError::Kind kind, const std::filesystem::path& path, std::string_view what,
-                   int error) {
-  return {kind, path.native() + ": " + std::string(what) + ": " + errnoText(error)};
+Failure<StoreError> failure(StoreError code, const std::filesystem::path& path,
+                            std::string_view what, int error) {
+  return {code, path.native() + ": " + std::string(what) + ": " + errnoText(error)};
 }
 
 std::filesystem::path withSuffix(const std::filesystem::path& path, std::string_view suffix) {
@@ -65,48 +65,47 @@ std::optional<FileIdentity> fileIdentity(const std::filesystem::path& path) {
 StoreFiles::StoreFiles(const std::filesystem::path& directory)
     : directory_(directory), database_(directory / kStoreFileName) {}
 
-std::optional<StoreError> StoreFiles::claimDirectory() {
+Result<void, StoreError> StoreFiles::claimDirectory() {
   struct stat status {};
   // The lock is useless once its file was removed: another service would create and lock a new one.
-  if (lock_ && ::fstat(lock_.get(), &status) == 0 && status.st_nlink > 0) return std::nullopt;
+  if (lock_ && ::fstat(lock_.get(), &status) == 0 && status.st_nlink > 0) return {};
   std::error_code error;
   std::filesystem::create_directories(directory_, error);
   if (error) {
-    return failure(StoreError::Kind::kDirectory, directory_, "cannot create the storage directory",
+    return failure(StoreError::kDirectory, directory_, "cannot create the storage directory",
                    error.value());
   }
   const std::filesystem::path path = directory_ / kLockFileName;
   lock_.reset(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, kFileMode));
   if (!lock_) {
-    return failure(StoreError::Kind::kDirectory, path, "cannot open the lock file", errno);
+    return failure(StoreError::kDirectory, path, "cannot open the lock file", errno);
   }
-  if (::flock(lock_.get(), LOCK_EX | LOCK_NB) == 0) return std::nullopt;
+  if (::flock(lock_.get(), LOCK_EX | LOCK_NB) == 0) return {};
   const int reason = errno;
   lock_.reset();
   if (reason != EWOULDBLOCK) {
-    return failure(StoreError::Kind::kCannotOpen, path, "cannot lock the file", reason);
+    return failure(StoreError::kCannotOpen, path, "cannot lock the file", reason);
   }
-  return StoreError{StoreError::Kind::kInUse,
-                    database_.native() +
-                        ": another service is using this store; stop it or set "
-                        "another storage.directory"};
+  return Failure<StoreError>{StoreError::kInUse,
+                             database_.native() +
+                                 ": another service is using this store; stop it or set "
+                                 "another storage.directory"};
 }
 
-std::optional<StoreError> StoreFiles::makeDatabaseFile() {
+Result<void, StoreError> StoreFiles::makeDatabaseFile() {
   // The log of a database that was removed must not be applied to the new one.
   if (sizeOf(database_) == 0 && logBytes() > 0) {
-    std::string newName;
-    if (auto error = setAside(newName)) return error;
+    if (auto log = setAside(); !log) return std::move(log).error();
   }
   // SQLite would make it readable for everybody. It gives its log the mode of the database.
   const UniqueFd made(::open(database_.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, kFileMode));
-  if (made || errno == EEXIST) return std::nullopt;
-  return failure(StoreError::Kind::kDirectory, database_, "cannot create the database file", errno);
+  if (made || errno == EEXIST) return {};
+  return failure(StoreError::kDirectory, database_, "cannot create the database file", errno);
 }
 
-std::optional<StoreError> StoreFiles::setAside(std::string& newName) {
+Result<std::string, StoreError> StoreFiles::setAside() {
   const std::string wanted = database_.native() + ".damaged-" + utcStamp();
-  newName = wanted;
+  std::string newName = wanted;
   for (int number = 2; anyExists(newName) && number < kMostNamesTried; ++number) {
     newName = wanted + "-" + std::to_string(number);
   }
@@ -115,9 +114,9 @@ std::optional<StoreError> StoreFiles::setAside(std::string& newName) {
     if (::rename(from.c_str(), withSuffix(newName, suffix).c_str()) == 0 || errno == ENOENT) {
       continue;
     }
-    return failure(StoreError::Kind::kDirectory, from, "cannot rename the damaged file", errno);
+    return failure(StoreError::kDirectory, from, "cannot rename the damaged file", errno);
   }
-  return std::nullopt;
+  return newName;
 }
 
 std::optional<FileIdentity> StoreFiles::identity() const { return fileIdentity(database_); }

@@ -7,6 +7,7 @@
 
 #include <sys/types.h>
 
+#include "platform/linux/base/Result.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/store/StoreError.h"
 
@@ -29,13 +30,13 @@ class StoreFiles {
   // Creates the directory and its parents, and takes the lock that keeps a second service out.
   // Holds the lock until this object is destroyed. A second call is cheap and takes the lock again
   // if the lock file was removed. Fails with kDirectory, kInUse or kCannotOpen.
-  [[nodiscard]] std::optional<StoreError> claimDirectory();
+  Result<void, StoreError> claimDirectory();
   // Creates an empty database file, readable by owner and group, unless one exists. First renames
   // a write-ahead log that has no database: SQLite deletes such a log when it opens an empty file.
-  [[nodiscard]] std::optional<StoreError> makeDatabaseFile();
+  Result<void, StoreError> makeDatabaseFile();
   // Renames the database, its log and its index to halvox.db.damaged-<UTC time> and returns the
-  // new path in `newName`. Nothing is deleted. The database must not be open in this process.
-  [[nodiscard]] std::optional<StoreError> setAside(std::string& newName);
+  // new path. Nothing is deleted. The database must not be open in this process.
+  Result<std::string, StoreError> setAside();
 
   [[nodiscard]] const std::filesystem::path& database() const { return database_; }
   // The file that the database's path leads to now; std::nullopt when there is none.

@@ -46,7 +46,7 @@ void writeFile(const std::filesystem::path& path, std::string_view content) {
   stream << content;
 }
 
-std::optional<StoreError> StoreFixture::open() {
+Result<void, StoreError> StoreFixture::open() {
   service.reset();
   store.reset();
   store = std::make_unique<SqliteStore>(
@@ -83,7 +83,5 @@ std::uint64_t StoreFixture::dropped() const {
 }
 
 std::string numbered(std::int64_t number) { return "{\"number\":" + std::to_string(number) + "}"; }
-
-void PrintTo(const StoreError& error, std::ostream* stream) { *stream << error.description; }
 
 }  // namespace halvox::platform::linux_

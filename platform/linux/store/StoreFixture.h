@@ -34,9 +34,12 @@ class StoreFixture : public ::testing::Test {
   StoreFixture() { options.directory = scratch.path() / "state" / "halvox"; }
 
   // Makes a store with `options` and opens it.
-  [[nodiscard]] std::optional<StoreError> open();
+  Result<void, StoreError> open();
   // The same; fails the test on an error.
-  void start() { ASSERT_EQ(open(), std::nullopt) << "cannot open the store"; }
+  void start() {
+    const auto opened = open();
+    ASSERT_TRUE(opened) << "cannot open the store: " << opened.error().message;
+  }
   // Writes what waits and closes the store.
   void stop() { store.reset(); }
 
@@ -64,7 +67,5 @@ class StoreFixture : public ::testing::Test {
 
 // The payload of send(number).
 [[nodiscard]] std::string numbered(std::int64_t number);
-
-void PrintTo(const StoreError& error, std::ostream* stream);
 
 }  // namespace halvox::platform::linux_

@@ -27,21 +27,13 @@ constexpr std::uint64_t kLargestPayload = 256 * kMegabyte;
 // written. Half of the half second within which a stored record must be visible.
 constexpr std::chrono::milliseconds kBusyTimeout{250};
 
-StoreError failure(StoreError::Kind kind, const StoreFiles& files, const std::string& what) {
-  return {kind, files.database().native() + ": " + what};
+Failure<StoreError> failure(StoreError code, const StoreFiles& files, const std::string& what) {
+  return {code, files.database().native() + ": " + what};
 }
 
-// The outcome of one attempt to open the database. `reason` is set unless it was opened.
-struct Attempt {
-  enum class Outcome : std::uint8_t { kOpened, kDamaged, kFailed };
-  Outcome outcome;
-  StoreError reason{};
-};
-
-Attempt judged(SqliteCode code, const StoreFiles& files, const Database& database) {
-  return {meansDamage(code) ? Attempt::Outcome::kDamaged : Attempt::Outcome::kFailed,
-          failure(StoreError::Kind::kCannotOpen, files,
-                  "cannot open the database: " + database.errorText())};
+Failure<StoreError> judged(SqliteCode code, const StoreFiles& files, const Database& database) {
+  return failure(meansDamage(code) ? StoreError::kDamaged : StoreError::kCannotOpen, files,
+                 "cannot open the database: " + database.errorText());
 }
 
 std::string pragmas(const StoreSizes& sizes) {
@@ -61,7 +53,7 @@ std::string pragmas(const StoreSizes& sizes) {
 }
 
 // Opens the file without changing it: a database of a newer version must stay as it is.
-Attempt examine(const StoreFiles& files, Database& database) {
+Result<void, StoreError> examine(const StoreFiles& files, Database& database) {
   SqliteCode code = database.open(files.database(), DatabaseAccess::kReadWrite);
   if (code != SQLITE_OK) return judged(code, files, database);
   // Before the first statement: another program may hold a lock while the service starts.
@@ -75,26 +67,29 @@ Attempt examine(const StoreFiles& files, Database& database) {
     return judged(sqlite3_extended_errcode(database.get()), files, database);
   }
   if (*version > kStoreSchemaVersion) {
-    return {Attempt::Outcome::kFailed,
-            failure(StoreError::Kind::kNewerVersion, files,
-                    "expected a database of version " + std::to_string(kStoreSchemaVersion) +
-                        " or older, found version " + std::to_string(*version) +
-                        ", made by a newer release")};
+    return failure(StoreError::kNewerVersion, files,
+                   "expected a database of version " + std::to_string(kStoreSchemaVersion) +
+                       " or older, found version " + std::to_string(*version) +
+                       ", made by a newer release");
   }
   // SQLite opens a file that it cannot write to without an error, for reading only.
   if (sqlite3_db_readonly(database.get(), "main") == 1) {
-    return {Attempt::Outcome::kFailed,
-            failure(StoreError::Kind::kDirectory, files, "cannot write to the database file")};
+    return failure(StoreError::kDirectory, files, "cannot write to the database file");
   }
-  return {Attempt::Outcome::kOpened};
+  return {};
 }
 
-Attempt attempt(const StoreFiles& files, const StoreSizes& sizes, Database& database) {
-  Attempt result = examine(files, database);
-  if (result.outcome != Attempt::Outcome::kOpened) return result;
-  SqliteCode code = database.execute(pragmas(sizes));
-  if (code == SQLITE_OK) code = migrate(database);
-  return code == SQLITE_OK ? result : judged(code, files, database);
+// Opens the file and migrates it. Does not leave the database open after a failure.
+Result<void, StoreError> attempt(const StoreFiles& files, const StoreSizes& sizes,
+                                 Database& database) {
+  auto opened = examine(files, database);
+  if (opened) {
+    SqliteCode code = database.execute(pragmas(sizes));
+    if (code == SQLITE_OK) code = migrate(database);
+    if (code != SQLITE_OK) opened = judged(code, files, database);
+  }
+  if (!opened) abandon(database);
+  return opened;
 }
 
 }  // namespace
@@ -122,24 +117,19 @@ void abandon(Database& database) {
   database.close();
 }
 
-std::optional<StoreError> openStoreDatabase(StoreFiles& files, const StoreSizes& sizes,
-                                            Database& database) {
-  if (auto error = files.claimDirectory()) return error;
-  if (auto error = files.makeDatabaseFile()) return error;
-  Attempt result = attempt(files, sizes, database);
-  if (result.outcome == Attempt::Outcome::kOpened) return std::nullopt;
-  abandon(database);
-  if (result.outcome == Attempt::Outcome::kFailed) return result.reason;
+Result<void, StoreError> openStoreDatabase(StoreFiles& files, const StoreSizes& sizes,
+                                           Database& database) {
+  if (auto claimed = files.claimDirectory(); !claimed) return claimed;
+  if (auto made = files.makeDatabaseFile(); !made) return made;
+  auto opened = attempt(files, sizes, database);
+  if (opened || opened.error().code != StoreError::kDamaged) return opened;
 
-  std::string newName;
-  if (auto error = files.setAside(newName)) return error;
-  kLog.error("the database is damaged: ", result.reason.description, "; it was set aside as ",
-             newName, ", and an empty database takes its place");
-  if (auto error = files.makeDatabaseFile()) return error;
-  result = attempt(files, sizes, database);
-  if (result.outcome == Attempt::Outcome::kOpened) return std::nullopt;
-  abandon(database);
-  return result.reason;
+  const auto newName = files.setAside();
+  if (!newName) return newName.error();
+  kLog.error("the database is damaged: ", opened.error().message, "; it was set aside as ",
+             *newName, ", and an empty database takes its place");
+  if (auto made = files.makeDatabaseFile(); !made) return made;
+  return attempt(files, sizes, database);
 }
 
 }  // namespace halvox::platform::linux_

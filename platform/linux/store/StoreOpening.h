@@ -1,8 +1,8 @@
 #pragma once
 
 #include <cstdint>
-#include <optional>
 
+#include "platform/linux/base/Result.h"
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreError.h"
 #include "platform/linux/store/StoreFiles.h"
@@ -26,9 +26,8 @@ struct StoreSizes {
 //
 // Blocks on the disk, and up to 250 ms for each lock that another process holds. `files` and
 // `database` belong to the caller.
-[[nodiscard]] std::optional<StoreError> openStoreDatabase(StoreFiles& files,
-                                                          const StoreSizes& sizes,
-                                                          Database& database);
+Result<void, StoreError> openStoreDatabase(StoreFiles& files, const StoreSizes& sizes,
+                                           Database& database);
 
 // Closes a database without copying its write-ahead log into it, so that damaged files stay as
 // they are and can be examined. Does nothing when the database is not open.

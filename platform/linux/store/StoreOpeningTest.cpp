@@ -42,26 +42,26 @@ TEST_F(StoreOpeningTest, MakesDirectoriesThatAreMissing) {
 TEST_F(StoreOpeningTest, SaysThatTheDirectoryCannotBeMade) {
   writeFile(scratch.path() / "file", "");
   options.directory = scratch.path() / "file" / "state";
-  const auto error = open();
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->kind, StoreError::Kind::kDirectory);
-  EXPECT_THAT(error->description, HasSubstr((scratch.path() / "file").native()));
+  const auto opened = open();
+  ASSERT_FALSE(opened);
+  EXPECT_EQ(opened.error().code, StoreError::kDirectory);
+  EXPECT_THAT(opened.error().message, HasSubstr((scratch.path() / "file").native()));
 }
 
 TEST_F(StoreOpeningTest, SaysThatTheDirectoryCannotBeWritten) {
   options.directory = "/proc/self";
-  const auto error = open();
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->kind, StoreError::Kind::kDirectory);
+  const auto opened = open();
+  ASSERT_FALSE(opened);
+  EXPECT_EQ(opened.error().code, StoreError::kDirectory);
 }
 
 TEST_F(StoreOpeningTest, RefusesAStoreThatAnotherServiceWrites) {
   start();
   SqliteStore second(options, {platform.clock, platform.statistics, backpressure});
-  const auto error = second.open();
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->kind, StoreError::Kind::kInUse);
-  EXPECT_THAT(error->description, HasSubstr("another service"));
+  const auto opened = second.open();
+  ASSERT_FALSE(opened);
+  EXPECT_EQ(opened.error().code, StoreError::kInUse);
+  EXPECT_THAT(opened.error().message, HasSubstr("another service"));
 }
 
 TEST_F(StoreOpeningTest, TakesTheStoreOverOnceTheOtherServiceHasEnded) {
@@ -75,10 +75,10 @@ TEST_F(StoreOpeningTest, LeavesADatabaseOfANewerVersionAsItIs) {
   execute(database(), "PRAGMA user_version = 99");
   const std::string before = readFile(database());
 
-  const auto error = open();
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->kind, StoreError::Kind::kNewerVersion);
-  EXPECT_THAT(error->description, HasSubstr("99"));
+  const auto opened = open();
+  ASSERT_FALSE(opened);
+  EXPECT_EQ(opened.error().code, StoreError::kNewerVersion);
+  EXPECT_THAT(opened.error().message, HasSubstr("99"));
   EXPECT_EQ(readFile(database()), before);
   EXPECT_THAT(setAsideFiles(), IsEmpty());
 }
@@ -144,9 +144,9 @@ TEST_F(StoreOpeningTest, SetsALogWithoutItsDatabaseAside) {
 
 TEST_F(StoreOpeningTest, RefusesADirectoryInPlaceOfTheDatabase) {
   std::filesystem::create_directories(database());
-  const auto error = open();
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->kind, StoreError::Kind::kCannotOpen);
+  const auto opened = open();
+  ASSERT_FALSE(opened);
+  EXPECT_EQ(opened.error().code, StoreError::kCannotOpen);
 }
 
 TEST_F(StoreOpeningTest, MarksTheDatabaseWithItsVersion) {

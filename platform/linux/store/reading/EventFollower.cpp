@@ -24,9 +24,9 @@ constexpr long kLookAgainNanoseconds = 25'000'000;
 constexpr std::uint32_t kWatched =
     IN_MODIFY | IN_CREATE | IN_MOVED_TO | IN_DELETE_SELF | IN_MOVE_SELF | IN_ONLYDIR;
 
-StoreError systemFailure(const std::filesystem::path& directory) {
-  const auto kind = errno == ENOENT || errno == ENOTDIR ? StoreError::Kind::kMissing
-                                                        : StoreError::Kind::kCannotOpen;
+Failure<StoreError> systemFailure(const std::filesystem::path& directory) {
+  const auto kind =
+      errno == ENOENT || errno == ENOTDIR ? StoreError::kMissing : StoreError::kCannotOpen;
   return {kind, directory.native() + ": cannot watch the directory: " + errnoText(errno)};
 }
 
@@ -37,8 +37,8 @@ bool isStoreFile(std::string_view name) {
 
 }  // namespace
 
-std::optional<StoreError> EventFollower::open(const std::filesystem::path& directory,
-                                              const RecordFilter& filter) {
+Result<void, StoreError> EventFollower::open(const std::filesystem::path& directory,
+                                             const RecordFilter& filter) {
   directory_ = directory;
   filter_ = filter;
   started_ = false;
@@ -61,51 +61,52 @@ std::optional<StoreError> EventFollower::open(const std::filesystem::path& direc
   return reader_.open(directory);
 }
 
-std::optional<StoreError> EventFollower::deliver(const StoreReader::EventCallback& callback) {
+Result<void, StoreError> EventFollower::deliver(const StoreReader::EventCallback& callback) {
   return deliverBy([&] { return reader_.forEachEvent(filter_, callback); });
 }
 
-std::optional<StoreError> EventFollower::deliver(const RecordTable& table,
-                                                 const StoreReader::RecordCallback& callback) {
+Result<void, StoreError> EventFollower::deliver(const RecordTable& table,
+                                                const StoreReader::RecordCallback& callback) {
   return deliverBy([&] { return reader_.forEachRecord(table, filter_, callback); });
 }
 
 template <typename Read>
-std::optional<StoreError> EventFollower::deliverBy(Read read) {
+Result<void, StoreError> EventFollower::deliverBy(Read read) {
   const Change change = readChanges();
   if (change == Change::kDirectoryGone) {
-    return StoreError{StoreError::Kind::kMissing,
-                      directory_.native() + ": the directory was removed"};
+    return Failure<StoreError>{StoreError::kMissing,
+                               directory_.native() + ": the directory was removed"};
   }
   const bool timerRan = readTimer();
   if (change == Change::kStoreWritten) looksLeft_ = kLooksAgain;
-  if (change == Change::kNone && !timerRan && started_) return std::nullopt;
+  if (change == Change::kNone && !timerRan && started_) return {};
   if (looksLeft_ > 0) startTimer();
-  bool isOpen = true;
   if (reader_.isReplaced()) {
-    if (auto error = reopen(isOpen)) return error;
+    const auto isOpen = reopen();
+    if (!isOpen) return isOpen.error();
+    if (!*isOpen) return {};
   }
-  if (!isOpen) return std::nullopt;
   started_ = true;
-  auto error = read();
+  Result<void, StoreError> done = read();
   // Not after the last record that was delivered: when the filter lets none through, as `newest` 0
   // does, everything that is stored would count as new the next time.
-  if (!error.has_value()) filter_.after = std::max(filter_.after, reader_.lastRead());
+  if (done) filter_.after = std::max(filter_.after, reader_.lastRead());
   // Limits the first delivery only: all that comes later is new.
   filter_.newest.reset();
-  return error;
+  return done;
 }
 
-// Opens the database that replaced the old one; its record IDs start from 1. `isOpen` is false
-// while there is none. A database that is still being created can fail in any way, so an error
-// counts only after the last look.
-std::optional<StoreError> EventFollower::reopen(bool& isOpen) {
-  auto error = reader_.open(directory_);
-  isOpen = !error.has_value();
-  if (isOpen) filter_.after = 0;
-  const bool isFinal =
-      error.has_value() && error->kind != StoreError::Kind::kMissing && looksLeft_ == 0;
-  return isFinal ? error : std::nullopt;
+// Opens the database that replaced the old one; its record IDs start from 1. Returns false while
+// there is none. A database that is still being created can fail in any way, so an error counts
+// only after the last look.
+Result<bool, StoreError> EventFollower::reopen() {
+  auto opened = reader_.open(directory_);
+  if (opened) {
+    filter_.after = 0;
+  } else if (opened.error().code != StoreError::kMissing && looksLeft_ == 0) {
+    return std::move(opened).error();
+  }
+  return opened.has_value();
 }
 
 EventFollower::Change EventFollower::readChanges() {

@@ -1,8 +1,8 @@
 #pragma once
 
 #include <filesystem>
-#include <optional>
 
+#include "platform/linux/base/Result.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/store/StoreError.h"
 #include "platform/linux/store/reading/StoreReader.h"
@@ -20,29 +20,28 @@ class EventFollower {
   // Starts to watch the store in `directory`. The first deliver() has the records that are stored
   // already and pass the filter. Fails as StoreReader::open() does, or with kCannotOpen or kMissing
   // when the directory cannot be watched.
-  [[nodiscard]] std::optional<StoreError> open(const std::filesystem::path& directory,
-                                               const RecordFilter& filter);
+  Result<void, StoreError> open(const std::filesystem::path& directory, const RecordFilter& filter);
   // Becomes readable (poll) when deliver() should be called. Owned by this object.
   [[nodiscard]] int descriptor() const { return poller_.get(); }
   // Calls `callback` on this thread for each event that was stored since the last delivery. Does
   // not wait for events. Returns an error, after which following ends, when the directory was
   // removed or the database cannot be read.
-  [[nodiscard]] std::optional<StoreError> deliver(const StoreReader::EventCallback& callback);
+  Result<void, StoreError> deliver(const StoreReader::EventCallback& callback);
   // The same for the records of another kind. Do not mix kinds in one follower: it remembers one
   // position.
-  [[nodiscard]] std::optional<StoreError> deliver(const RecordTable& table,
-                                                  const StoreReader::RecordCallback& callback);
+  Result<void, StoreError> deliver(const RecordTable& table,
+                                   const StoreReader::RecordCallback& callback);
 
  private:
   enum class Change : unsigned char { kNone, kStoreWritten, kDirectoryGone };
 
   // Calls `read` when there may be new records.
   template <typename Read>
-  [[nodiscard]] std::optional<StoreError> deliverBy(Read read);
+  Result<void, StoreError> deliverBy(Read read);
   [[nodiscard]] Change readChanges();
   [[nodiscard]] bool readTimer();
   void startTimer();
-  [[nodiscard]] std::optional<StoreError> reopen(bool& isOpen);
+  Result<bool, StoreError> reopen();
 
   std::filesystem::path directory_;
   RecordFilter filter_;

@@ -34,33 +34,34 @@ std::string immutableURI(const std::string& path) {
 
 }  // namespace
 
-std::optional<StoreError> StoreReader::open(const std::filesystem::path& directory) {
+Result<void, StoreError> StoreReader::open(const std::filesystem::path& directory) {
   database_.close();
   files_.emplace(directory);
   identity_.reset();
   struct stat status {};
   if (::stat(files_->database().c_str(), &status) != 0) {
-    const auto kind = errno == ENOENT || errno == ENOTDIR ? StoreError::Kind::kMissing
-                                                          : StoreError::Kind::kCannotOpen;
-    return StoreError{kind, files_->database().native() + ": " + errnoText(errno)};
+    const auto kind =
+        errno == ENOENT || errno == ENOTDIR ? StoreError::kMissing : StoreError::kCannotOpen;
+    return Failure<StoreError>{kind, files_->database().native() + ": " + errnoText(errno)};
   }
   // Opening a pipe would block until somebody writes to it.
   if (!S_ISREG(status.st_mode)) {
-    return StoreError{StoreError::Kind::kCannotOpen,
-                      files_->database().native() +
-                          ": expected a regular file, found a directory, a pipe or a device"};
+    return Failure<StoreError>{
+        StoreError::kCannotOpen,
+        files_->database().native() +
+            ": expected a regular file, found a directory, a pipe or a device"};
   }
-  auto error = openDatabase();
-  if (error.has_value()) {
-    database_.close();
-  } else {
+  auto opened = openDatabase();
+  if (opened) {
     // From before the opening: if another file took the name in between, isReplaced() notices.
     identity_ = FileIdentity{status.st_dev, status.st_ino};
+  } else {
+    database_.close();
   }
-  return error;
+  return opened;
 }
 
-std::optional<StoreError> StoreReader::openDatabase() {
+Result<void, StoreError> StoreReader::openDatabase() {
   const SqliteCode code = openFile();
   if (code != SQLITE_OK) return failure(code);
   const auto version = database_.queryInteger("PRAGMA user_version");
@@ -68,13 +69,13 @@ std::optional<StoreError> StoreReader::openDatabase() {
   const std::string& path = files_->database().native();
   // A service that has just started may have made the file and no table yet.
   if (*version == 0) {
-    return StoreError{StoreError::Kind::kMissing, path + ": nothing has been stored yet"};
+    return Failure<StoreError>{StoreError::kMissing, path + ": nothing has been stored yet"};
   }
-  if (*version <= kStoreSchemaVersion) return std::nullopt;
-  return StoreError{StoreError::Kind::kNewerVersion,
-                    path + ": expected a database of version " +
-                        std::to_string(kStoreSchemaVersion) + " or older, found version " +
-                        std::to_string(*version) + ", made by a newer release"};
+  if (*version <= kStoreSchemaVersion) return {};
+  return Failure<StoreError>{StoreError::kNewerVersion,
+                             path + ": expected a database of version " +
+                                 std::to_string(kStoreSchemaVersion) + " or older, found version " +
+                                 std::to_string(*version) + ", made by a newer release"};
 }
 
 SqliteCode StoreReader::openFile() {
@@ -95,9 +96,9 @@ SqliteCode StoreReader::openFile() {
   return needsLog && files_->logBytes() == 0 ? attempt(immutableURI(path)) : code;
 }
 
-std::optional<StoreError> StoreReader::forEachEvent(const RecordFilter& filter,
-                                                    const EventCallback& callback) {
-  if (!database_.isOpen()) return StoreError{StoreError::Kind::kMissing, "no store is open"};
+Result<void, StoreError> StoreReader::forEachEvent(const RecordFilter& filter,
+                                                   const EventCallback& callback) {
+  if (!database_.isOpen()) return Failure<StoreError>{StoreError::kMissing, "no store is open"};
   EventScan scan(database_, filter);
   SqliteCode code = scan.begin();
   EventScan::Piece piece;
@@ -109,19 +110,19 @@ std::optional<StoreError> StoreReader::forEachEvent(const RecordFilter& filter,
   }
   if (code != SQLITE_OK) return failure(code);
   lastRead_ = scan.last();
-  return std::nullopt;
+  return {};
 }
 
-std::optional<StoreError> StoreReader::forEachRecord(const RecordTable& table,
-                                                     const RecordFilter& filter,
-                                                     const RecordCallback& callback) {
-  if (!database_.isOpen()) return StoreError{StoreError::Kind::kMissing, "no store is open"};
+Result<void, StoreError> StoreReader::forEachRecord(const RecordTable& table,
+                                                    const RecordFilter& filter,
+                                                    const RecordCallback& callback) {
+  if (!database_.isOpen()) return Failure<StoreError>{StoreError::kMissing, "no store is open"};
   // Read for each call: a service may have migrated the store since it was opened.
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   lastRead_ = 0;
   // A store that an older service wrote lacks the table, and has no such records.
-  if (*version < table.sinceVersion) return std::nullopt;
+  if (*version < table.sinceVersion) return {};
   RecordScan scan(database_, table, filter);
   SqliteCode code = scan.begin();
   std::vector<StoredRecord> piece;
@@ -131,16 +132,16 @@ std::optional<StoreError> StoreReader::forEachRecord(const RecordTable& table,
   }
   if (code != SQLITE_OK) return failure(code);
   lastRead_ = scan.last();
-  return std::nullopt;
+  return {};
 }
 
 bool StoreReader::isReplaced() const {
   return !database_.isOpen() || files_->identity() != identity_;
 }
 
-StoreError StoreReader::failure(SqliteCode code) const {
+Failure<StoreError> StoreReader::failure(SqliteCode code) const {
   const bool damaged = meansDamage(code);
-  return {damaged ? StoreError::Kind::kDamaged : StoreError::Kind::kCannotOpen,
+  return {damaged ? StoreError::kDamaged : StoreError::kCannotOpen,
           files_->database().native() +
               (damaged ? ": the database is damaged: " : ": cannot read the database: ") +
               database_.errorText()};

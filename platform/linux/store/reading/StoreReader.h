@@ -9,6 +9,7 @@
 #include <variant>
 #include <vector>
 
+#include "platform/linux/base/Result.h"
 #include "platform/linux/store/RecordTables.h"
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreError.h"
@@ -76,18 +77,16 @@ class StoreReader {
 
   // Opens the store in `directory`, and closes the one that was open. Fails with kMissing when
   // there is none or nothing was stored yet, kDamaged, kNewerVersion or kCannotOpen.
-  [[nodiscard]] std::optional<StoreError> open(const std::filesystem::path& directory);
+  Result<void, StoreError> open(const std::filesystem::path& directory);
 
   // Calls `callback` on this thread for each event that passes the filter, oldest first in the
   // order of storing. Delivers what was stored when the call began. Waits up to one second for a
   // locked database. After an error, the events before it have been delivered.
-  [[nodiscard]] std::optional<StoreError> forEachEvent(const RecordFilter& filter,
-                                                       const EventCallback& callback);
+  Result<void, StoreError> forEachEvent(const RecordFilter& filter, const EventCallback& callback);
   // The same for the records of another kind. A store of an older version that lacks the kind has
   // no such records, which is not an error.
-  [[nodiscard]] std::optional<StoreError> forEachRecord(const RecordTable& table,
-                                                        const RecordFilter& filter,
-                                                        const RecordCallback& callback);
+  Result<void, StoreError> forEachRecord(const RecordTable& table, const RecordFilter& filter,
+                                         const RecordCallback& callback);
 
   // The last record that the last complete reading looked at, whether the filter let it through or
   // not. A reading after it misses no record.
@@ -98,8 +97,8 @@ class StoreReader {
   [[nodiscard]] bool isReplaced() const;
 
  private:
-  [[nodiscard]] StoreError failure(SqliteCode code) const;
-  [[nodiscard]] std::optional<StoreError> openDatabase();
+  [[nodiscard]] Failure<StoreError> failure(SqliteCode code) const;
+  Result<void, StoreError> openDatabase();
   [[nodiscard]] SqliteCode openFile();
 
   std::optional<StoreFiles> files_;

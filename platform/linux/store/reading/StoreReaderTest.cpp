@@ -29,20 +29,20 @@ class StoreReaderTest : public StoreFixture {
   std::vector<std::string> read(const RecordFilter& filter) {
     StoreReader reader;
     std::vector<std::string> found;
-    auto error = reader.open(options.directory);
-    if (!error) {
-      error = reader.forEachEvent(
+    auto done = reader.open(options.directory);
+    if (done) {
+      done = reader.forEachEvent(
           filter, [&](const StoredEvent& event) { found.emplace_back(event.payload); });
     }
-    EXPECT_FALSE(error.has_value()) << error->description;
+    EXPECT_TRUE(done) << done.error().message;
     return found;
   }
 
-  StoreError::Kind openError() {
+  StoreError openError() {
     StoreReader reader;
-    const auto error = reader.open(options.directory);
-    EXPECT_TRUE(error.has_value());
-    return error.value_or(StoreError{}).kind;
+    const auto opened = reader.open(options.directory);
+    EXPECT_FALSE(opened);
+    return opened ? StoreError{} : opened.error().code;
   }
 };
 
@@ -60,12 +60,12 @@ TEST_F(StoreReaderTest, ReadsWhenNoServiceRuns) {
 TEST_F(StoreReaderTest, GivesTimeAndName) {
   store1000(2);
   StoreReader reader;
-  ASSERT_EQ(reader.open(options.directory), std::nullopt);
+  ASSERT_TRUE(reader.open(options.directory));
   std::vector<std::string> found;
-  const auto error = reader.forEachEvent({}, [&](const StoredEvent& event) {
+  const auto read = reader.forEachEvent({}, [&](const StoredEvent& event) {
     found.push_back(std::to_string(event.time) + " " + std::string(event.name));
   });
-  EXPECT_EQ(error, std::nullopt);
+  EXPECT_TRUE(read);
   EXPECT_THAT(found, ElementsAre("1000.000000 even", "1001.000000 odd"));
 }
 
@@ -121,10 +121,9 @@ TEST_F(StoreReaderTest, GivesOneOfTheTwoEventsOfAMessage) {
 TEST_F(StoreReaderTest, ReadsFromAGivenEventOn) {
   store1000(5);
   StoreReader reader;
-  ASSERT_EQ(reader.open(options.directory), std::nullopt);
+  ASSERT_TRUE(reader.open(options.directory));
   std::vector<StoredRecordID> ids;
-  ASSERT_EQ(reader.forEachEvent({}, [&](const StoredEvent& event) { ids.push_back(event.id); }),
-            std::nullopt);
+  ASSERT_TRUE(reader.forEachEvent({}, [&](const StoredEvent& event) { ids.push_back(event.id); }));
   EXPECT_THAT(read({.after = ids[2]}), ElementsAre(numbered(3), numbered(4)));
   EXPECT_THAT(read({.after = ids[4]}), IsEmpty());
 }
@@ -132,48 +131,43 @@ TEST_F(StoreReaderTest, ReadsFromAGivenEventOn) {
 TEST_F(StoreReaderTest, DoesNotHoldASnapshotDuringTheCallback) {
   store1000(3);
   StoreReader reader;
-  ASSERT_EQ(reader.open(options.directory), std::nullopt);
+  ASSERT_TRUE(reader.open(options.directory));
   bool checkpointed = false;
-  ASSERT_EQ(reader.forEachEvent(
-                {.newest = 1},
-                [&](const StoredEvent&) {
-                  checkpointed = rows(database(), "PRAGMA wal_checkpoint(PASSIVE)").size() == 1;
-                  send(99);
-                  EXPECT_TRUE(allIsStored());
-                }),
-            std::nullopt);
+  ASSERT_TRUE(reader.forEachEvent({.newest = 1}, [&](const StoredEvent&) {
+    checkpointed = rows(database(), "PRAGMA wal_checkpoint(PASSIVE)").size() == 1;
+    send(99);
+    EXPECT_TRUE(allIsStored());
+  }));
   EXPECT_TRUE(checkpointed);
   EXPECT_THAT(read({.newest = 1}), ElementsAre(numbered(99)));
 }
 
 TEST_F(StoreReaderTest, ReadsNothingAfterAFailedOpening) {
   StoreReader reader;
-  ASSERT_TRUE(reader.open(options.directory).has_value());
-  const auto error =
+  ASSERT_FALSE(reader.open(options.directory));
+  const auto read =
       reader.forEachEvent({}, [](const StoredEvent&) { FAIL() << "there is no event"; });
-  ASSERT_TRUE(error.has_value());
-  EXPECT_EQ(error->kind, StoreError::Kind::kMissing);
+  ASSERT_FALSE(read);
+  EXPECT_EQ(read.error().code, StoreError::kMissing);
 }
 
-TEST_F(StoreReaderTest, SaysThatThereIsNoStore) {
-  EXPECT_EQ(openError(), StoreError::Kind::kMissing);
-}
+TEST_F(StoreReaderTest, SaysThatThereIsNoStore) { EXPECT_EQ(openError(), StoreError::kMissing); }
 
 TEST_F(StoreReaderTest, SaysThatNothingWasStoredYet) {
   writeFile(database(), "");
-  EXPECT_EQ(openError(), StoreError::Kind::kMissing);
+  EXPECT_EQ(openError(), StoreError::kMissing);
 }
 
 TEST_F(StoreReaderTest, RefusesAPipeInPlaceOfTheFileWithoutWaiting) {
   std::filesystem::create_directories(options.directory);
   ASSERT_EQ(::mkfifo((options.directory / "halvox.db").c_str(), 0600), 0);
 
-  EXPECT_EQ(openError(), StoreError::Kind::kCannotOpen);
+  EXPECT_EQ(openError(), StoreError::kCannotOpen);
 }
 
 TEST_F(StoreReaderTest, SaysThatTheFileIsDamagedAndLeavesItThere) {
   writeFile(database(), "this is not a database, whatever its name says");
-  EXPECT_EQ(openError(), StoreError::Kind::kDamaged);
+  EXPECT_EQ(openError(), StoreError::kDamaged);
   EXPECT_TRUE(std::filesystem::exists(database()));
 }
 
@@ -181,13 +175,13 @@ TEST_F(StoreReaderTest, SaysThatTheDatabaseIsOfANewerVersion) {
   store1000(1);
   stop();
   execute(database(), "PRAGMA user_version = 7");
-  EXPECT_EQ(openError(), StoreError::Kind::kNewerVersion);
+  EXPECT_EQ(openError(), StoreError::kNewerVersion);
 }
 
 TEST_F(StoreReaderTest, NoticesThatTheDatabaseWasReplaced) {
   store1000(1);
   StoreReader reader;
-  ASSERT_EQ(reader.open(options.directory), std::nullopt);
+  ASSERT_TRUE(reader.open(options.directory));
   EXPECT_FALSE(reader.isReplaced());
   std::filesystem::rename(database(), database().native() + ".old");
   EXPECT_TRUE(reader.isReplaced());
