@@ -31,9 +31,9 @@ int refuse(int exitStatus, const std::string& why) {
 int serve(const Configuration& configuration) {
   LinuxPlatform adapters(configuration);
   platform::installServices(adapters.services());
-  if (const auto failure = adapters.open()) {
+  if (const auto opened = adapters.open(); !opened) {
     static_cast<void>(adapters.close());
-    return refuse(failure->exitStatus, failure->description);
+    return refuse(opened.error().code, opened.error().message);
   }
   // After the services are installed, which its constructor uses. Nothing is accepted before
   // resume(), which returns when the service is asked to end.

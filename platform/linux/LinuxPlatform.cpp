@@ -6,6 +6,7 @@
 #include <sysexits.h>
 
 #include "platform/linux/LinuxAdapters.h"
+#include "platform/linux/StartFailure.h"
 #include "platform/linux/drivers/ConfiguredSources.h"
 
 namespace halvox::platform::linux_ {
@@ -74,9 +75,9 @@ Services LinuxPlatform::services() {
           .tlmReporting = adapters_->realTimeLink()};
 }
 
-std::optional<StartFailure> LinuxPlatform::open() {
+Result<void, int> LinuxPlatform::open() {
   if (!adapters_->natsFailure.empty()) {
-    return StartFailure{EX_CONFIG, "link.backend = \"nats\" needs " + adapters_->natsFailure};
+    return Failure<int>{EX_CONFIG, "link.backend = \"nats\" needs " + adapters_->natsFailure};
   }
   // The store before the sockets: whatever is accepted can then be kept.
   if (const auto opened = adapters_->store.open(); !opened) return startFailure(opened.error());
@@ -89,7 +90,7 @@ std::optional<StartFailure> LinuxPlatform::open() {
     return startFailure(opened.error());
   }
   logStart();
-  return std::nullopt;
+  return {};
 }
 
 bool LinuxPlatform::close() {

@@ -2,9 +2,8 @@
 
 #include <cstdint>
 #include <memory>
-#include <optional>
 
-#include "platform/linux/StartFailure.h"
+#include "platform/linux/base/Result.h"
 #include "platform/object_log.h"
 #include "platform/services.h"
 
@@ -28,8 +27,8 @@ class LinuxPlatform {
 
   [[nodiscard]] Services services();
   // Opens the store, then the socket, so that nothing is accepted that could not be kept.
-  // The services must be installed.
-  [[nodiscard]] std::optional<StartFailure> open();
+  // The services must be installed. The code of a failure is the exit status of the process.
+  Result<void, int> open();
   // Ends the queues, writes what waits for the store, and logs the statistics. False when a job or
   // the link does not end: the process must then end without destroying anything.
   [[nodiscard]] bool close();

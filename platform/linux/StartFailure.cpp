@@ -49,11 +49,11 @@ int exitStatus(ConnectionOpenError error) {
 
 }  // namespace
 
-StartFailure startFailure(const Failure<StoreError>& failure) {
+Failure<int> startFailure(const Failure<StoreError>& failure) {
   return {exitStatus(failure.code), failure.message};
 }
 
-StartFailure startFailure(const Failure<ConnectionOpenError>& failure) {
+Failure<int> startFailure(const Failure<ConnectionOpenError>& failure) {
   return {exitStatus(failure.code), failure.message};
 }
 
