@@ -284,7 +284,8 @@ def tidy(database, path, *arguments):
         ["clang-tidy", "-p", str(database), "--quiet", *arguments, str(path)],
         stdout=subprocess.PIPE, stderr=subprocess.PIPE, text=True, check=False,
     )
-    if run.returncode == 0:
+    # It succeeds, too, when it skips a file that has no compile command.
+    if run.returncode == 0 and "Compile command not found" not in run.stderr:
         return None
     return run.stdout if run.stdout.strip() else run.stdout + run.stderr
 
@@ -294,7 +295,10 @@ def main():
         print(__doc__, file=sys.stderr)
         return 2
     build = Path(sys.argv[1]).resolve()
-    units = plan(read_sources(build, sys.stdin.read().split()))
+    paths = sys.stdin.read().split()
+    if not paths:
+        raise SystemExit("clang_tidy: expected the names of sources on the standard input, found none")
+    units = plan(read_sources(build, paths))
     folder, paths = write_units(build, units)
 
     with ThreadPoolExecutor(len(os.sched_getaffinity(0))) as pool:

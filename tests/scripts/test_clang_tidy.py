@@ -152,6 +152,16 @@ class Findings(unittest.TestCase):
         self.assertEqual((run.returncode, run.stdout), (0, ""), run)
         self.assertIn("one by one", run.stderr)
 
+    def test_what_is_not_read_is_no_success(self):
+        paths = self.write({"a.cpp": CLEAN % "first"})
+        self.assertNotEqual(self.run_script([]).returncode, 0)
+        self.assertIn("no compile command", self.run_script([*paths, "missing.cpp"]).stderr)
+        other = self.tree / "other.cpp"
+        other.write_text(CLEAN % "other", encoding="utf-8")
+        (self.build / "empty").mkdir()
+        (self.build / "empty/compile_commands.json").write_text("[]", encoding="utf-8")
+        self.assertIn("not found", tidy(self.build / "empty", other))
+
     def test_a_source_that_does_not_compile_fails(self):
         run = self.run_script(self.write({"a.cpp": CLEAN % "first", "b.cpp": "int broken( {\n"}))
         self.assertEqual(run.returncode, 1, run)
