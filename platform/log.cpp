@@ -1,6 +1,22 @@
 #include "platform/log.h"
 
-namespace halvox::platform::detail {
+namespace halvox::platform {
+
+std::string_view levelName(LogLevel level) {
+  switch (level) {
+    case LogLevel::kDebug:
+      return "debug";
+    case LogLevel::kInfo:
+      return "info";
+    case LogLevel::kDefault:
+      return "default";
+    case LogLevel::kError:
+      return "error";
+  }
+  return "error";
+}
+
+namespace detail {
 
 std::string logPrefix(std::string_view unit, std::uint32_t line) {
   constexpr std::size_t kUnitWidth = 25;
@@ -17,4 +33,5 @@ std::string logPrefix(std::string_view unit, std::uint32_t line) {
   return prefix;
 }
 
-}  // namespace halvox::platform::detail
+}  // namespace detail
+}  // namespace halvox::platform

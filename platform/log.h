@@ -15,6 +15,9 @@ namespace halvox::platform {
 // The levels of the unified log, least important first; isEnabled() compares them in this order.
 enum class LogLevel : std::uint8_t { kDebug, kInfo, kDefault, kError };
 
+// Returns "debug", "info", "default" or "error", as log lines and the configuration spell it.
+std::string_view levelName(LogLevel level);
+
 // One category of the log.
 //
 // The log service makes it once and keeps it for the life of the process, so callers keep a

@@ -3,7 +3,6 @@
 namespace halvox {
 namespace {
 
-using platform::LogLevel;
 using testing::ElementsAre;
 using testing::StartsWith;
 
@@ -18,23 +17,10 @@ class HVReportingServiceLogTest : public ServiceFixture {
     std::vector<std::string> texts;
     for (const auto& line : platform_.log.lines()) {
       if (isOfALink(line.text)) continue;
-      texts.push_back(name(line.level) + " " + line.category + ": " + line.text);
+      texts.push_back(std::string(levelName(line.level)) + " " + line.category + ": " + line.text);
     }
     platform_.log.clear();
     return texts;
-  }
-  static std::string name(LogLevel level) {
-    switch (level) {
-      case LogLevel::kDebug:
-        return "debug";
-      case LogLevel::kInfo:
-        return "info";
-      case LogLevel::kDefault:
-        return "default";
-      case LogLevel::kError:
-        return "error";
-    }
-    return {};
   }
   static std::string seven(int started) {
     return "(reporterID=7,serviceName=unknown,ownerPid=100,HostApplicationDisplayID=Unknown,"

@@ -6,23 +6,6 @@
 #include "platform/linux/base/Utf8.h"
 
 namespace halvox::platform::linux_ {
-namespace {
-
-std::string_view levelWord(LogLevel level) {
-  switch (level) {
-    case LogLevel::kDebug:
-      return "debug";
-    case LogLevel::kInfo:
-      return "info";
-    case LogLevel::kDefault:
-      return "default";
-    case LogLevel::kError:
-      return "error";
-  }
-  return "error";
-}
-
-}  // namespace
 
 // localtime_r() and strftime() cost more than the rest of a line together; lines of the same second
 // share their result.
@@ -48,7 +31,7 @@ std::string_view LogLineFormatter::format(const LogEntry& entry) {
     line_ += static_cast<char>('0' + milliseconds / unit % 10);
   }
   line_ += zoneText_;
-  line_ += levelWord(entry.level);
+  line_ += levelName(entry.level);
   line_ += " [";
   line_ += entry.subsystem;
   line_ += ':';
