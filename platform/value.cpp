@@ -11,6 +11,8 @@ namespace halvox::platform {
 
 using detail::ArrayRep;
 using detail::DataRep;
+using detail::DictionaryRep;
+using detail::Reference;
 using detail::StringRep;
 
 namespace {
@@ -103,17 +105,17 @@ Value::Value(Date date) noexcept {
 
 Value::Value(Data data) noexcept {
   setTag(Tag::kData);
-  setPayload(std::exchange(data.rep_, nullptr));
+  setPayload(data.rep_.take());
 }
 
 Value::Value(Array array) noexcept {
   setTag(Tag::kArray);
-  setPayload(std::exchange(array.rep_, nullptr));
+  setPayload(array.rep_.take());
 }
 
 Value::Value(Dictionary dictionary) noexcept {
   setTag(Tag::kDictionary);
-  setPayload(std::exchange(dictionary.rep_, nullptr));
+  setPayload(dictionary.rep_.take());
 }
 
 // Every counted node begins with its reference count, so the kind of node does not matter here. An
@@ -133,25 +135,17 @@ void Value::release() noexcept {
       break;
     }
     case Tag::kData:
-      detail::releaseData(payload<DataRep*>());
+      if (auto* rep = payload<DataRep*>()) detail::release(*rep);
       break;
     case Tag::kArray:
-      detail::releaseArray(payload<ArrayRep*>());
+      if (auto* rep = payload<ArrayRep*>()) detail::release(*rep);
       break;
     case Tag::kDictionary:
-      detail::releaseDictionary(payload<detail::DictionaryRep*>());
+      if (auto* rep = payload<DictionaryRep*>()) detail::release(*rep);
       break;
     case Tag::kNone:
-    case Tag::kBool:
-    case Tag::kUInt8:
-    case Tag::kInt16:
-    case Tag::kUInt16:
-    case Tag::kInt32:
-    case Tag::kUInt32:
-    case Tag::kInt64:
-    case Tag::kUInt64:
-    case Tag::kFloat:
-    case Tag::kDouble:
+    case Tag::kFirstNumber:
+    case Tag::kLastNumber:
     case Tag::kDate:
     case Tag::kInlineString:
     case Tag::kConstantString:
@@ -161,8 +155,8 @@ void Value::release() noexcept {
 }
 
 void Value::setNumber(NumberKind kind, std::int64_t number) noexcept {
-  storage_[0] =
-      static_cast<unsigned char>(static_cast<unsigned>(Tag::kBool) + static_cast<unsigned>(kind));
+  storage_[0] = static_cast<unsigned char>(static_cast<unsigned>(Tag::kFirstNumber) +
+                                           static_cast<unsigned>(kind));
   setPayload(number);
 }
 
@@ -180,7 +174,7 @@ void Value::setNumber(NumberKind kind, double number) noexcept {
 ValueKind Value::kind() const {
   const Tag current = tag();
   if (current == Tag::kNone) return ValueKind::kNone;
-  if (current <= Tag::kDouble) return ValueKind::kNumber;
+  if (current <= Tag::kLastNumber) return ValueKind::kNumber;
   if (current == Tag::kDate) return ValueKind::kDate;
   if (current <= Tag::kSharedString) return ValueKind::kString;
   if (current == Tag::kData) return ValueKind::kData;
@@ -188,7 +182,7 @@ ValueKind Value::kind() const {
 }
 
 NumberKind Value::numberKind() const {
-  return static_cast<NumberKind>(storage_[0] - static_cast<unsigned char>(Tag::kBool));
+  return static_cast<NumberKind>(storage_[0] - static_cast<unsigned char>(Tag::kFirstNumber));
 }
 
 std::int64_t Value::toInt64() const {
@@ -265,7 +259,7 @@ Array Value::array() const {
 Dictionary Value::dictionary() const {
   if (tag() != Tag::kDictionary) return {};
   retain();
-  return Dictionary(payload<detail::DictionaryRep*>());
+  return Dictionary(payload<DictionaryRep*>());
 }
 
 std::size_t Value::memorySize() const {
@@ -326,24 +320,20 @@ bool operator==(const Value& left, const Value& right) {
 
 // --- Data ---------------------------------------------------------------------------------------
 
-void detail::releaseData(DataRep* rep) noexcept {
-  if (rep == nullptr || !releaseLast(rep->references)) return;
-  rep->~DataRep();
-  ::operator delete(rep);
+void detail::retain(DataRep& node) noexcept { retain(node.references); }
+
+void detail::release(DataRep& node) noexcept {
+  if (!releaseLast(node.references)) return;
+  node.~DataRep();
+  ::operator delete(&node);
 }
 
-Data::Data(std::span<const std::byte> bytes) : rep_(nullptr) {
+Data::Data(std::span<const std::byte> bytes) {
   if (bytes.empty()) return;
   void* memory = detail::allocateNode<DataRep>(bytes.size());
-  rep_ = new (memory) DataRep{{1}, bytes.size()};
+  rep_ = Reference(new (memory) DataRep{{1}, bytes.size()});
   std::copy(bytes.begin(), bytes.end(), rep_->bytes());
 }
-
-Data::Data(const Data& other) noexcept : rep_(other.rep_) {
-  if (rep_ != nullptr) detail::retain(rep_->references);
-}
-
-Data::~Data() { detail::releaseData(rep_); }
 
 std::span<const std::byte> Data::bytes() const {
   return rep_ == nullptr ? std::span<const std::byte>{} : std::span(rep_->bytes(), rep_->length);
@@ -355,25 +345,21 @@ bool operator==(const Data& left, const Data& right) {
 
 // --- Array --------------------------------------------------------------------------------------
 
-void detail::releaseArray(ArrayRep* rep) noexcept {
-  if (rep == nullptr || !releaseLast(rep->references)) return;
-  std::destroy_n(rep->values(), rep->count);
-  rep->~ArrayRep();
-  ::operator delete(rep);
+void detail::retain(ArrayRep& node) noexcept { retain(node.references); }
+
+void detail::release(ArrayRep& node) noexcept {
+  if (!releaseLast(node.references)) return;
+  std::destroy_n(node.values(), node.count);
+  node.~ArrayRep();
+  ::operator delete(&node);
 }
 
 Array::Array(std::span<const Value> values) {
   if (values.empty()) return;
   void* memory = detail::allocateNode<ArrayRep>(values.size_bytes());
-  rep_ = new (memory) ArrayRep{{1}, static_cast<std::uint32_t>(values.size())};
+  rep_ = Reference(new (memory) ArrayRep{{1}, static_cast<std::uint32_t>(values.size())});
   std::uninitialized_copy(values.begin(), values.end(), rep_->values());
 }
-
-Array::Array(const Array& other) noexcept : rep_(other.rep_) {
-  if (rep_ != nullptr) detail::retain(rep_->references);
-}
-
-Array::~Array() { detail::releaseArray(rep_); }
 
 std::size_t Array::size() const { return rep_ == nullptr ? 0 : rep_->count; }
 const Value* Array::begin() const { return rep_ == nullptr ? nullptr : rep_->values(); }

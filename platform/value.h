@@ -45,11 +45,56 @@ class StringConstant {
 };
 
 namespace detail {
+
 struct KeyNode;
-struct StringRep;
 struct DataRep;
 struct ArrayRep;
 struct DictionaryRep;
+
+void retain(KeyNode& node) noexcept;
+void retain(DataRep& node) noexcept;
+void retain(ArrayRep& node) noexcept;
+void retain(DictionaryRep& node) noexcept;
+// Each gives up one reference and destroys the node if it was the last.
+void release(KeyNode& node) noexcept;
+void release(DataRep& node) noexcept;
+void release(ArrayRep& node) noexcept;
+void release(DictionaryRep& node) noexcept;
+
+// One counted reference to a node that copies share; null if there is no content. Different threads
+// may use different references to one node; one reference belongs to one thread at a time.
+template <typename Node>
+class Reference {
+ public:
+  Reference() noexcept = default;
+  // Takes over a reference that is already counted.
+  explicit Reference(Node* node) noexcept : node_(node) {}
+  Reference(const Reference& other) noexcept : node_(other.node_) {
+    if (node_ != nullptr) retain(*node_);
+  }
+  Reference(Reference&& other) noexcept : node_(other.take()) {}
+  Reference& operator=(Reference other) noexcept {
+    std::swap(node_, other.node_);
+    return *this;
+  }
+  ~Reference() {
+    if (node_ != nullptr) release(*node_);
+  }
+
+  Node& operator*() const { return *node_; }
+  Node* operator->() const { return node_; }
+  friend bool operator==(const Reference&, const Reference&) = default;
+  friend bool operator==(const Reference& reference, std::nullptr_t) {
+    return reference.node_ == nullptr;
+  }
+
+  // Returns the node, still counted, and is null from then on.
+  [[nodiscard]] Node* take() { return std::exchange(node_, nullptr); }
+
+ private:
+  Node* node_ = nullptr;
+};
+
 }  // namespace detail
 
 // The key of a dictionary entry: an immutable text. Equal keys share one node, which makes
@@ -63,13 +108,6 @@ class Key {
   Key(std::string_view text);
   Key(const char* text) : Key(std::string_view(text)) {}
   Key(const std::string& text) : Key(std::string_view(text)) {}
-  Key(const Key& other) noexcept;
-  Key(Key&& other) noexcept : node_(std::exchange(other.node_, nullptr)) {}
-  Key& operator=(Key other) noexcept {
-    std::swap(node_, other.node_);
-    return *this;
-  }
-  ~Key();
 
   // Valid while a copy of this key exists.
   [[nodiscard]] std::string_view text() const;
@@ -87,20 +125,13 @@ class Key {
   friend bool operator==(const Key& left, const Key& right);
 
  private:
-  detail::KeyNode* node_;
+  detail::Reference<detail::KeyNode> node_;
 };
 
 // An immutable sequence of bytes, shared by all copies. Copies may be used by different threads.
 class Data {
  public:
   explicit Data(std::span<const std::byte> bytes);
-  Data(const Data& other) noexcept;
-  Data(Data&& other) noexcept : rep_(std::exchange(other.rep_, nullptr)) {}
-  Data& operator=(Data other) noexcept {
-    std::swap(rep_, other.rep_);
-    return *this;
-  }
-  ~Data();
 
   // Valid while a copy of this object exists.
   [[nodiscard]] std::span<const std::byte> bytes() const;
@@ -110,7 +141,7 @@ class Data {
  private:
   friend class Value;
   explicit Data(detail::DataRep* rep) : rep_(rep) {}
-  detail::DataRep* rep_;
+  detail::Reference<detail::DataRep> rep_;
 };
 
 // The type that a number was made from. Comparison ignores it; encoders use it to write the number
@@ -222,17 +253,9 @@ class Value {
  private:
   enum class Tag : std::uint8_t {
     kNone,
-    // Numbers, in the order of NumberKind.
-    kBool,
-    kUInt8,
-    kInt16,
-    kUInt16,
-    kInt32,
-    kUInt32,
-    kInt64,
-    kUInt64,
-    kFloat,
-    kDouble,
+    // One tag for each NumberKind, in its order.
+    kFirstNumber,
+    kLastNumber = kFirstNumber + static_cast<std::uint8_t>(NumberKind::kDouble),
     kDate,
     kInlineString,
     kConstantString,
@@ -278,13 +301,6 @@ class Array {
   Array() noexcept = default;
   Array(std::initializer_list<Value> values) : Array(std::span(values.begin(), values.size())) {}
   explicit Array(std::span<const Value> values);
-  Array(const Array& other) noexcept;
-  Array(Array&& other) noexcept : rep_(std::exchange(other.rep_, nullptr)) {}
-  Array& operator=(Array other) noexcept {
-    std::swap(rep_, other.rep_);
-    return *this;
-  }
-  ~Array();
 
   [[nodiscard]] std::size_t size() const;
   [[nodiscard]] bool empty() const { return size() == 0; }
@@ -298,7 +314,7 @@ class Array {
  private:
   friend class Value;
   explicit Array(detail::ArrayRep* rep) : rep_(rep) {}
-  detail::ArrayRep* rep_ = nullptr;
+  detail::Reference<detail::ArrayRep> rep_;
 };
 
 // A dictionary from texts to values.
@@ -319,13 +335,6 @@ class Dictionary {
 
   Dictionary() noexcept = default;
   Dictionary(std::initializer_list<Entry> entries);
-  Dictionary(const Dictionary& other) noexcept;
-  Dictionary(Dictionary&& other) noexcept : rep_(std::exchange(other.rep_, nullptr)) {}
-  Dictionary& operator=(Dictionary other) noexcept {
-    std::swap(rep_, other.rep_);
-    return *this;
-  }
-  ~Dictionary();
 
   [[nodiscard]] std::size_t size() const;
   [[nodiscard]] bool empty() const { return size() == 0; }
@@ -361,7 +370,7 @@ class Dictionary {
   friend class Value;
   explicit Dictionary(detail::DictionaryRep* rep) : rep_(rep) {}
   void makeRoomFor(std::size_t entries);
-  detail::DictionaryRep* rep_ = nullptr;
+  detail::Reference<detail::DictionaryRep> rep_;
 };
 
 // A message as the components pass it on. It may be absent: a client can send none.

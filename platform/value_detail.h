@@ -89,9 +89,4 @@ struct DictionaryRep {
 // clients: without the secret nobody can choose keys that collide.
 std::uint32_t secretHash(std::string_view text);
 
-// Each gives up one reference and destroys the node if it was the last. Null is allowed.
-void releaseData(DataRep* rep) noexcept;
-void releaseArray(ArrayRep* rep) noexcept;
-void releaseDictionary(DictionaryRep* rep) noexcept;
-
 }  // namespace halvox::platform::detail

@@ -9,14 +9,17 @@ using detail::DictionaryRep;
 
 namespace {
 
+using Reference = detail::Reference<DictionaryRep>;
+
 // Up to this number of entries, comparing all keys is faster than an index: interned keys compare
 // as pointers.
 constexpr std::uint32_t kMaxWithoutIndex = 16;
 constexpr std::uint32_t kFirstCapacity = 4;
 
-DictionaryRep* allocateRep(std::size_t capacity) {
+Reference allocateRep(std::size_t capacity) {
   void* memory = detail::allocateNode<DictionaryRep>(capacity * sizeof(Dictionary::Entry));
-  return new (memory) DictionaryRep{{1}, 0, static_cast<std::uint32_t>(capacity), 0, nullptr};
+  return Reference(new (memory)
+                       DictionaryRep{{1}, 0, static_cast<std::uint32_t>(capacity), 0, nullptr});
 }
 
 void addToIndex(DictionaryRep& rep, std::uint32_t entry) {
@@ -56,7 +59,7 @@ void copyIndex(DictionaryRep& rep, const DictionaryRep& other) {
 }
 
 template <typename Matches>
-Dictionary::Entry* findEntry(DictionaryRep* rep, std::string_view key, const Matches& matches) {
+Dictionary::Entry* findEntry(const Reference& rep, std::string_view key, const Matches& matches) {
   if (rep == nullptr) return nullptr;
   Dictionary::Entry* entries = rep->entries();
   if (rep->indexSize == 0) {
@@ -73,31 +76,27 @@ Dictionary::Entry* findEntry(DictionaryRep* rep, std::string_view key, const Mat
   return nullptr;
 }
 
-Dictionary::Entry* findEntry(DictionaryRep* rep, const Key& key) {
+Dictionary::Entry* findEntry(const Reference& rep, const Key& key) {
   return findEntry(rep, key.text(),
                    [&key](const Dictionary::Entry& entry) { return entry.key == key; });
 }
 
 }  // namespace
 
-void detail::releaseDictionary(DictionaryRep* rep) noexcept {
-  if (rep == nullptr || !releaseLast(rep->references)) return;
-  std::destroy_n(rep->entries(), rep->count);
-  delete[] rep->index;
-  rep->~DictionaryRep();
-  ::operator delete(rep);
+void detail::retain(DictionaryRep& node) noexcept { retain(node.references); }
+
+void detail::release(DictionaryRep& node) noexcept {
+  if (!releaseLast(node.references)) return;
+  std::destroy_n(node.entries(), node.count);
+  delete[] node.index;
+  node.~DictionaryRep();
+  ::operator delete(&node);
 }
 
 Dictionary::Dictionary(std::initializer_list<Entry> entries) {
   reserve(entries.size());
   for (const Entry& entry : entries) set(entry.key, entry.value);
 }
-
-Dictionary::Dictionary(const Dictionary& other) noexcept : rep_(other.rep_) {
-  if (rep_ != nullptr) detail::retain(rep_->references);
-}
-
-Dictionary::~Dictionary() { detail::releaseDictionary(rep_); }
 
 std::size_t Dictionary::size() const { return rep_ == nullptr ? 0 : rep_->count; }
 
@@ -129,7 +128,7 @@ void Dictionary::makeRoomFor(std::size_t entries) {
   // that it needs. One that grows entry by entry grows by half.
   const std::size_t capacity =
       alone ? std::max<std::size_t>(entries, rep_->capacity + rep_->capacity / 2) : entries;
-  DictionaryRep* grown = allocateRep(capacity);
+  Reference grown = allocateRep(capacity);
   if (alone) {
     std::uninitialized_move_n(rep_->entries(), rep_->count, grown->entries());
     std::swap(grown->index, rep_->index);
@@ -140,7 +139,7 @@ void Dictionary::makeRoomFor(std::size_t entries) {
     grown->count = rep_->count;
     copyIndex(*grown, *rep_);
   }
-  detail::releaseDictionary(std::exchange(rep_, grown));
+  rep_ = std::move(grown);
 }
 
 void Dictionary::reserve(std::size_t entries) {

@@ -90,16 +90,14 @@ KeyNode* nodeFor(std::string_view text) {
 
 Key::Key(std::string_view text) : node_(nodeFor(text)) {}
 
-Key::Key(const Key& other) noexcept : node_(other.node_) {
-  if (node_ != nullptr && !node_->interned) detail::retain(node_->references);
+void detail::retain(KeyNode& node) noexcept {
+  if (!node.interned) retain(node.references);
 }
 
-Key::~Key() {
-  if (node_ == nullptr || node_->interned) return;
-  if (detail::releaseLast(node_->references)) {
-    node_->~KeyNode();
-    ::operator delete(node_);
-  }
+void detail::release(KeyNode& node) noexcept {
+  if (node.interned || !releaseLast(node.references)) return;
+  node.~KeyNode();
+  ::operator delete(&node);
 }
 
 std::string_view Key::text() const { return node_->view(); }
