@@ -8,7 +8,7 @@
 #include <gtest/gtest.h>
 #include <pipewire/pipewire.h>
 
-#include "platform/linux/pipewire/testing/PrivatePipeWire.h"
+#include "platform/linux/pipewire/testing/PipeWireFixture.h"
 #include "platform/linux/testing/Eventually.h"
 #include "reporters/pipewire/MainLoop.h"
 #include "reporters/pipewire/RecordingReportingClient.h"
@@ -17,18 +17,15 @@ namespace halvox::pipewire_reporter {
 namespace {
 
 using pipewire_testing::PipedProcess;
-using pipewire_testing::PrivatePipeWire;
+using pipewire_testing::PipeWireFixture;
 using std::chrono::steady_clock;
 
 // What the reporter sends for real streams of a private PipeWire.
-class StreamWatcherTest : public testing::Test {
+class StreamWatcherTest : public PipeWireFixture {
  protected:
   void SetUp() override {
-    if (const auto missing = PrivatePipeWire::missingTools(); !missing.empty()) {
-      GTEST_SKIP() << missing;
-    }
-    audio = std::make_unique<PrivatePipeWire>();
-    ASSERT_TRUE(audio->isReady());
+    PipeWireFixture::SetUp();
+    if (audio == nullptr) return;
     loop = std::make_unique<MainLoop>();
     pw_loop_enter(loop->handle());
     follow({.remote = {}, .log = {}});
@@ -65,7 +62,6 @@ class StreamWatcherTest : public testing::Test {
         {"pw-play", "--volume", "0.5", "--media-role", role, audio->makeTone(seconds)});
   }
 
-  std::unique_ptr<PrivatePipeWire> audio;
   std::unique_ptr<MainLoop> loop;
   RecordingReportingClient client;
   StreamTracker tracker{client};

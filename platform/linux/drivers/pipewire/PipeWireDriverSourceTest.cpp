@@ -12,7 +12,7 @@
 #include "platform/fake/FakePlatform.h"
 #include "platform/linux/drivers/DriverSourceLog.h"
 #include "platform/linux/drivers/testing/MadeReadings.h"
-#include "platform/linux/pipewire/testing/PrivatePipeWire.h"
+#include "platform/linux/pipewire/testing/PipeWireFixture.h"
 #include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/ScratchDirectory.h"
 
@@ -21,7 +21,7 @@ namespace {
 
 using namespace std::chrono_literals;
 using pipewire_testing::PipedProcess;
-using pipewire_testing::PrivatePipeWire;
+using pipewire_testing::PipeWireFixture;
 using ::testing::ElementsAre;
 using Clock = std::chrono::steady_clock;
 
@@ -92,14 +92,11 @@ TEST(PipeWireDriverSourceAloneTest, AReadingMayOutliveTheSource) {
   EXPECT_GE(reading->values.size(), 2U);
 }
 
-class PipeWireDriverSourceTest : public ::testing::Test {
+class PipeWireDriverSourceTest : public PipeWireFixture {
  protected:
   void SetUp() override {
-    if (const auto missing = PrivatePipeWire::missingTools(); !missing.empty()) {
-      GTEST_SKIP() << missing;
-    }
-    audio = std::make_unique<PrivatePipeWire>();
-    ASSERT_TRUE(audio->isReady());
+    PipeWireFixture::SetUp();
+    if (audio == nullptr) return;
     source = std::make_unique<PipeWireDriverSource>(driversCategory(platform.log));
     source->open();
   }
@@ -110,7 +107,6 @@ class PipeWireDriverSourceTest : public ::testing::Test {
   }
 
   FakePlatform platform;
-  std::unique_ptr<PrivatePipeWire> audio;
   std::unique_ptr<PipeWireDriverSource> source;
 };
 
