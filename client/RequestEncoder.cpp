@@ -84,16 +84,48 @@ constexpr Header kSendMessage = makeHeader("sendMessage", "a{sv}uqaax");
 // Appends the header. The length of the body is set at the end of the body.
 template <typename Body>
 void writeFrame(SegmentWriter& writer, const Header& header, const Body& body) {
-  writer.bytes(header.bytes.data(), dbus::kBodyLengthOffset);
-  char* const length = writer.length();
-  const std::size_t rest = dbus::kSerialOffset;
-  writer.bytes(header.bytes.data() + rest, header.size - rest);
+  char* length = nullptr;
+  if (char* const at = writer.reserve(header.size); at != nullptr) {
+    std::memcpy(at, header.bytes.data(), header.size);
+    length = at + dbus::kBodyLengthOffset;
+    writer.commit(at + header.size);
+  } else {
+    writer.bytes(header.bytes.data(), dbus::kBodyLengthOffset);
+    length = writer.length();
+    const std::size_t rest = dbus::kSerialOffset;
+    writer.bytes(header.bytes.data() + rest, header.size - rest);
+  }
   const std::size_t start = writer.position();
   body();
   SegmentWriter::replaceLength(length, writer.position() - start);
 }
 
 // ---- Values
+
+// True for ASCII without NUL, which nearly all texts are. Spares the call and the byte by byte end
+// of the full test, a tenth of the time of a message.
+inline bool isPlainText(std::string_view text) {
+  constexpr std::uint64_t kEachByte = 0x0101010101010101;
+  constexpr std::uint64_t kEachHighBit = 0x8080808080808080;
+  constexpr std::size_t kWord = sizeof(std::uint64_t);
+  const auto signs = [&](std::size_t at) {
+    std::uint64_t word = 0;
+    std::memcpy(&word, text.data() + at, kWord);
+    return word | (word - kEachByte);  // subtracting one from a NUL sets its high bit
+  };
+  if (text.size() < kWord) {
+    bool plain = true;
+    for (const char character : text) plain &= static_cast<signed char>(character) > 0;
+    return plain;
+  }
+  std::uint64_t all = signs(text.size() - kWord);
+  for (std::size_t at = 0; at + kWord <= text.size(); at += kWord) all |= signs(at);
+  return (all & kEachHighBit) == 0;
+}
+
+inline bool isWireText(std::string_view text) {
+  return isPlainText(text) || platform::linux_::isUtf8WithoutNul(text);
+}
 
 // Copies a text whose length is seldom a constant and mostly small. memcpy() would be a call.
 inline char* copyText(char* to, std::string_view text) {
@@ -116,8 +148,7 @@ inline char* copyText(char* to, std::string_view text) {
 // Appends zeros up to a multiple of 8 or 4. Writes up to 8 bytes beyond.
 inline char* padded(char* at, std::size_t alignment) {
   std::memset(at, 0, 8);
-  const std::size_t misaligned = reinterpret_cast<std::uintptr_t>(at) & (alignment - 1);
-  return misaligned == 0 ? at : at + (alignment - misaligned);
+  return at + ((0 - reinterpret_cast<std::uintptr_t>(at)) & (alignment - 1));
 }
 
 template <typename Number>
@@ -126,9 +157,17 @@ inline char* put(char* at, Number number) {
   return at + sizeof number;
 }
 
+// Appends the signature of one basic type. Writes a zero beyond: one store of four bytes, because
+// three would go through the stack.
+inline char* putSignature(char* at, char type) {
+  const char bytes[4] = {1, type, 0, 0};
+  std::memcpy(at, bytes, sizeof bytes);
+  return at + 3;
+}
+
 template <typename Number>
 inline char* putNumber(char* at, char type, Number number) {
-  at = put(at, std::array<char, 3>{1, type, 0});
+  at = putSignature(at, type);
   return put(padded(at, sizeof number), number);
 }
 
@@ -137,8 +176,7 @@ inline char* putNumber(char* at, const Value& value) {
     case NumberKind::kBool:
       return putNumber(at, 'b', static_cast<std::uint32_t>(value.toBool()));
     case NumberKind::kUInt8:
-      return put(put(at, std::array<char, 3>{1, 'y', 0}),
-                 static_cast<std::uint8_t>(value.toUInt64()));
+      return put(putSignature(at, 'y'), static_cast<std::uint8_t>(value.toUInt64()));
     case NumberKind::kInt16:
       return putNumber(at, 'n', static_cast<std::int16_t>(value.toInt64()));
     case NumberKind::kUInt16:
@@ -222,7 +260,7 @@ class ValueWriter {
   }
 
   bool appendEntry(std::string_view key, const Value& value) {
-    if (!platform::linux_::isUtf8WithoutNul(key)) return fail("the key is not UTF-8 without NUL");
+    if (!isWireText(key)) return fail("the key is not UTF-8 without NUL");
     // Nearly all entries are numbers and short texts, and do not cross the border of a segment.
     const std::string_view text = value.string();
     char* at = writer_.reserve(key.size() + text.size() + kEntryRoom);
@@ -233,7 +271,7 @@ class ValueWriter {
       }
       if (value.isString()) {
         if (!isText(text)) return false;
-        at = put(putKey(at, key), std::array<char, 3>{1, 's', 0});
+        at = putSignature(putKey(at, key), 's');
         at = put(padded(at, 4), static_cast<std::uint32_t>(text.size()));
         writer_.commit(copyText(at, text));
         return true;
@@ -249,7 +287,7 @@ class ValueWriter {
   }
 
   bool isText(std::string_view text) {
-    return platform::linux_::isUtf8WithoutNul(text) || fail("the text is not UTF-8 without NUL");
+    return isWireText(text) || fail("the text is not UTF-8 without NUL");
   }
   void writeText(std::string_view text) {
     writer_.number(static_cast<std::uint32_t>(text.size()));

@@ -213,6 +213,22 @@ TEST_F(RequestEncoderTest, NestingPastTheWiresLimitIsRefused) {
   EXPECT_NE(error->find("nested too deep"), std::string::npos);
 }
 
+// A bad byte at every place of texts of every length around the size of a word.
+TEST_F(RequestEncoderTest, FindsNulsAndBytesThatAreNotUtf8AtAnyPlace) {
+  for (std::size_t size = 1; size <= 20; ++size) {
+    const std::string good(size, 'x');
+    EXPECT_EQ(errorOf({{good, good}}), std::nullopt);
+    for (std::size_t place = 0; place < size; ++place) {
+      for (const char bad : {'\0', '\xFF', '\x80'}) {
+        std::string text = good;
+        text[place] = bad;
+        EXPECT_TRUE(errorOf({{"key", text}})) << size << " " << place;
+        EXPECT_TRUE(errorOf({{text, 1}})) << size << " " << place;
+      }
+    }
+  }
+}
+
 TEST_F(RequestEncoderTest, SaysWhichElementOfWhichKeyHasNoForm) {
   const Dictionary inner{{"\xFF", 1}};
   const auto error = errorOf({{"list", platform::Array{1, inner}}});

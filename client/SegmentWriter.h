@@ -35,7 +35,7 @@ class SegmentSource {
 // own `source`, which must outlive it.
 class SegmentWriter {
  public:
-  explicit SegmentWriter(SegmentSource& source) : source_(source) {}
+  explicit SegmentWriter(SegmentSource& source) : source_(source) { extend(); }
 
   [[nodiscard]] bool isFull() const { return full_; }
   // The number of bytes so far.
