@@ -29,7 +29,7 @@ std::vector<std::string> passedEnvironment() {
 
 enum class ReadEnd : std::uint8_t { kAllRead, kTooMuch, kTimeOver };
 
-ReadEnd readOutput(int descriptor, std::size_t most, const Deadline& deadline,
+ReadEnd readOutput(int descriptor, std::size_t most, const CaptureDeadline& deadline,
                    std::string& output) {
   std::array<char, 16'384> buffer;
   for (;;) {
@@ -52,7 +52,7 @@ ReadEnd readOutput(int descriptor, std::size_t most, const Deadline& deadline,
 }
 
 // Waits for the end of a program that has closed its output. Returns std::nullopt at the deadline.
-std::optional<ChildEnd> awaitEnd(ChildProcess& child, const Deadline& deadline) {
+std::optional<ChildEnd> awaitEnd(ChildProcess& child, const CaptureDeadline& deadline) {
   std::array<pollfd, 2> polled{
       {{child.descriptor(), POLLIN, 0}, {deadline.stop().descriptor(), POLLIN, 0}}};
   int ready = 0;
@@ -65,7 +65,7 @@ std::optional<ChildEnd> awaitEnd(ChildProcess& child, const Deadline& deadline) 
 }  // namespace
 
 Finding runProgram(const std::vector<std::string>& command, std::size_t most,
-                   const Deadline& deadline) {
+                   const CaptureDeadline& deadline) {
   auto pipe = makePipe();
   if (!pipe) return Finding::failed(pipe.error().message);
   auto child =

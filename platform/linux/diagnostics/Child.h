@@ -21,6 +21,6 @@ namespace halvox::platform::linux_ {
 // has the first `most` bytes and is marked as cut. A program that is not installed, and one that
 // ends with a signal or a status other than 0, are failures.
 [[nodiscard]] Finding runProgram(const std::vector<std::string>& command, std::size_t most,
-                                 const Deadline& deadline);
+                                 const CaptureDeadline& deadline);
 
 }  // namespace halvox::platform::linux_

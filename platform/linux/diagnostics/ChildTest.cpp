@@ -16,7 +16,8 @@ class ChildTest : public ::testing::Test {
  protected:
   Finding run(const std::vector<std::string>& command, std::size_t most = 1000,
               std::chrono::milliseconds within = std::chrono::seconds(30)) {
-    return runProgram(command, most, Deadline(stop_, Deadline::Clock::now() + within));
+    return runProgram(command, most,
+                      CaptureDeadline(stop_, CaptureDeadline::Clock::now() + within));
   }
   WaitableFlag stop_;
 };
@@ -35,13 +36,13 @@ TEST_F(ChildTest, MissingProgramAndFailingProgramAreNamed) {
 }
 
 TEST_F(ChildTest, KillsASlowProgramWithItsChildren) {
-  const auto begun = Deadline::Clock::now();
+  const auto begun = CaptureDeadline::Clock::now();
 
   const Finding finding =
       run({"sh", "-c", "sleep 60 & sleep 60"}, 1000, std::chrono::milliseconds(100));
 
   EXPECT_EQ(finding.failure, "sh: did not end in time and was killed");
-  EXPECT_LT(Deadline::Clock::now() - begun, std::chrono::seconds(20));
+  EXPECT_LT(CaptureDeadline::Clock::now() - begun, std::chrono::seconds(20));
 }
 
 TEST_F(ChildTest, ProgramThatClosesItsOutputAndStaysIsKilled) {

@@ -24,7 +24,7 @@ class FactsTest : public ::testing::Test {
 
   ScratchDirectory root;
   WaitableFlag stop;
-  Deadline deadline{stop, Deadline::Clock::now() + std::chrono::seconds(30)};
+  CaptureDeadline deadline{stop, CaptureDeadline::Clock::now() + std::chrono::seconds(30)};
 };
 
 TEST_F(FactsTest, ProcessesAreFoundByTheirNameAndDescribed) {

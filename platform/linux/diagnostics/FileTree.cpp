@@ -11,7 +11,7 @@ namespace fs = std::filesystem;
 // Finds and sorts the paths before any file is read. Otherwise the order of the directory, which
 // is arbitrary, would decide which files are beyond the bounds.
 std::vector<fs::path> filesBelow(const fs::path& root, const TreeBounds& bounds,
-                                 const Deadline& deadline, Tree& tree) {
+                                 const CaptureDeadline& deadline, Tree& tree) {
   // Directories and other entries count too: a tree that has hardly any files must not be walked to
   // its end.
   constexpr std::size_t kLooksPerFile = 16;
@@ -41,7 +41,7 @@ std::vector<fs::path> filesBelow(const fs::path& root, const TreeBounds& bounds,
 
 }  // namespace
 
-Tree readTree(const fs::path& root, const TreeBounds& bounds, const Deadline& deadline) {
+Tree readTree(const fs::path& root, const TreeBounds& bounds, const CaptureDeadline& deadline) {
   Tree tree;
   std::size_t room = bounds.bytes;
   for (const fs::path& path : filesBelow(root, bounds, deadline, tree)) {

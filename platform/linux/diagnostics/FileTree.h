@@ -33,6 +33,6 @@ struct Tree {
 // Reads the regular files below a directory. Does not follow links. Blocks on the disk; stops at
 // the deadline.
 [[nodiscard]] Tree readTree(const std::filesystem::path& root, const TreeBounds& bounds,
-                            const Deadline& deadline);
+                            const CaptureDeadline& deadline);
 
 }  // namespace halvox::platform::linux_

@@ -181,7 +181,8 @@ Dictionary factsOf(const fs::path& procRoot, std::int32_t pid) {
 
 }  // namespace
 
-Dictionary processFacts(const fs::path& procRoot, std::string_view name, const Deadline& deadline) {
+Dictionary processFacts(const fs::path& procRoot, std::string_view name,
+                        const CaptureDeadline& deadline) {
   std::error_code error;
   std::uint64_t found = 0;
   std::vector<Value> processes;

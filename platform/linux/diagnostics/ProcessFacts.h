@@ -18,6 +18,6 @@ namespace halvox::platform::linux_ {
 //
 // Describes at most 8 processes, those with the lowest numbers; "found" counts all.
 [[nodiscard]] Dictionary processFacts(const std::filesystem::path& procRoot, std::string_view name,
-                                      const Deadline& deadline);
+                                      const CaptureDeadline& deadline);
 
 }  // namespace halvox::platform::linux_

@@ -19,7 +19,7 @@ constexpr std::size_t kBytesOfDump = 16U << 20U;
 // Reserved for the manifest, however large the other parts are.
 constexpr std::uint64_t kRoomForManifest = 1U << 20U;
 
-double secondsOf(Deadline::Clock::duration time) {
+double secondsOf(CaptureDeadline::Clock::duration time) {
   return std::chrono::duration<double>(time).count();
 }
 
@@ -32,7 +32,7 @@ struct StateAnswer {
 };
 
 // Waits for the flag. Returns false if the deadline passed first.
-bool awaitFlag(const WaitableFlag& flag, const Deadline& deadline) {
+bool awaitFlag(const WaitableFlag& flag, const CaptureDeadline& deadline) {
   while (!flag.isRaised() && !deadline.hasPassed()) {
     std::array<pollfd, 2> polled{
         {{flag.descriptor(), POLLIN, 0}, {deadline.stop().descriptor(), POLLIN, 0}}};
@@ -46,7 +46,7 @@ bool awaitFlag(const WaitableFlag& flag, const Deadline& deadline) {
 }  // namespace
 
 SnapshotCollector::SnapshotCollector(const SnapshotRequest& request, const SnapshotSources& sources,
-                                     SnapshotArchive& archive, const Deadline& deadline)
+                                     SnapshotArchive& archive, const CaptureDeadline& deadline)
     : request_(request), sources_(sources), archive_(archive), deadline_(deadline) {}
 
 // Parts that change quickly come first: they must show the moment of the request. Parts that may

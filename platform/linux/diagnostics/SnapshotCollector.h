@@ -45,14 +45,14 @@ class SnapshotCollector {
  public:
   // Does not own its arguments, which must outlive it.
   SnapshotCollector(const SnapshotRequest& request, const SnapshotSources& sources,
-                    SnapshotArchive& archive, const Deadline& deadline);
+                    SnapshotArchive& archive, const CaptureDeadline& deadline);
 
   // Collects all parts; call it once. Collects until the deadline at most, but may block longer on
   // the disk. Fails when the archive cannot be written or the service is ending.
   Result<void> collect();
 
  private:
-  using Clock = Deadline::Clock;
+  using Clock = CaptureDeadline::Clock;
 
   void addSignature();
   void addRequest();
@@ -72,7 +72,7 @@ class SnapshotCollector {
   const SnapshotRequest& request_;
   const SnapshotSources& sources_;
   SnapshotArchive& archive_;
-  const Deadline& deadline_;
+  const CaptureDeadline& deadline_;
   const Clock::time_point begun_ = Clock::now();
   PayloadEncoder encoder_;
   std::vector<Value> items_;  // the entries of the manifest

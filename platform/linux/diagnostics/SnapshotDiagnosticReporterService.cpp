@@ -187,7 +187,7 @@ Result<Snapshot> SnapshotDiagnosticReporterService::Worker::capture(
     // A copy: asking for the state waits, and must not hold the lock.
     sources.state = state_;
   }
-  const Deadline deadline(stop_, std::chrono::steady_clock::now() + options_.collectWithin);
+  const CaptureDeadline deadline(stop_, std::chrono::steady_clock::now() + options_.collectWithin);
   SnapshotArchive archive(directory_.temporaryPath(), options_.mostBytes);
   if (auto opened = archive.open(); !opened) return std::move(opened).error();
   SnapshotCollector collector(request, sources, archive, deadline);

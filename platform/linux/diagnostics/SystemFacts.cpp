@@ -53,7 +53,7 @@ Dictionary assignments(std::string_view text) {
 
 }  // namespace
 
-Dictionary systemFacts(const SystemPaths& paths, const Deadline& deadline) {
+Dictionary systemFacts(const SystemPaths& paths, const CaptureDeadline& deadline) {
   Dictionary facts{{"kernel", kernel()}};
   Dictionary failures;
   // /etc/os-release is a symbolic link on most systems, and readBounded() does not follow links.

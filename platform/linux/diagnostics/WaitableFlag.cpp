@@ -17,11 +17,11 @@ void WaitableFlag::raise() {
   static_cast<void>(!::write(event_.get(), &one, sizeof one));
 }
 
-Deadline Deadline::within(Clock::duration time) const {
+CaptureDeadline CaptureDeadline::within(Clock::duration time) const {
   return {stop_, std::min(end_, Clock::now() + time)};
 }
 
-int Deadline::millisecondsLeft() const {
+int CaptureDeadline::millisecondsLeft() const {
   if (hasPassed()) return 0;
   const auto left = std::chrono::ceil<std::chrono::milliseconds>(end_ - Clock::now());
   return static_cast<int>(std::max<std::chrono::milliseconds::rep>(left.count(), 0));

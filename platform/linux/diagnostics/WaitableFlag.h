@@ -28,15 +28,15 @@ class WaitableFlag {
 
 // When a capture must end: at a point in time, or earlier when `stop` is raised. A value; copies
 // are independent. Any thread may use it.
-class Deadline {
+class CaptureDeadline {
  public:
   using Clock = std::chrono::steady_clock;
 
   // `stop` must outlive this object and its copies.
-  Deadline(const WaitableFlag& stop, Clock::time_point end) : stop_(stop), end_(end) {}
+  CaptureDeadline(const WaitableFlag& stop, Clock::time_point end) : stop_(stop), end_(end) {}
 
   // Returns a deadline that ends `time` from now, but not later than this one.
-  [[nodiscard]] Deadline within(Clock::duration time) const;
+  [[nodiscard]] CaptureDeadline within(Clock::duration time) const;
   [[nodiscard]] const WaitableFlag& stop() const { return stop_; }
   [[nodiscard]] Clock::time_point end() const { return end_; }
   [[nodiscard]] bool hasPassed() const { return stop_.isRaised() || Clock::now() >= end_; }
