@@ -21,13 +21,15 @@ constexpr std::chrono::seconds kFarewell{1};
 // How often to look for work if there is no descriptor through which producers can wake the thread.
 constexpr std::chrono::milliseconds kPauseWithoutWakeUp{50};
 // While messages come, the worker naps instead of sleeping. A nap lasts an eighth of the time since
-// the last message, within these bounds. The shortest gathers messages; the longest costs a running
-// session a hundred wake-ups a second, about as many as its audio has.
+// the last message, within these bounds. The shortest gathers messages; the longest costs a
+// real-time client a hundred wake-ups a second while a session runs, about as many as its audio
+// has.
 constexpr std::chrono::milliseconds kShortestNap{1};
 constexpr std::chrono::milliseconds kLongestNap{10};
 constexpr int kNapShare = 8;
-// How long after a message the worker naps although no session runs.
-constexpr std::chrono::seconds kNapsAfterMessage{1};
+// How long after a message the worker naps. A client that sends twenty messages a second or more is
+// never woken; one that sends fewer is woken for each, and wakes up some twenty times after it.
+constexpr std::chrono::milliseconds kNapsAfterMessage{50};
 // How long a flush does the worker's work itself. The service answers a request within microseconds
 // unless it is busy, and then a change of threads does not matter.
 constexpr std::chrono::milliseconds kLongestHelp{2};
@@ -249,7 +251,8 @@ bool ClientWorker::mayFallAsleep() {
 
 std::chrono::milliseconds ClientWorker::napLength() const {
   const auto quiet = std::chrono::steady_clock::now() - lastMessage_;
-  if (made_.running() == 0 && quiet >= kNapsAfterMessage) return {};
+  const bool mayBeWoken = !options_.isRealTime || made_.running() == 0;
+  if (mayBeWoken && quiet >= kNapsAfterMessage) return {};
   const auto share = std::chrono::duration_cast<std::chrono::milliseconds>(quiet / kNapShare);
   return std::clamp(share, kShortestNap, kLongestNap);
 }

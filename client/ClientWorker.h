@@ -44,10 +44,11 @@ namespace halvox::client {
 // the service does not answer, the worker takes nothing from the lanes, and they fill up to their
 // bounds.
 //
-// How the worker learns of a message. While it has a running session, and for a second after a
-// message, it looks into the ring again and again, after naps of 1 to 10 milliseconds: send() must
-// not make a system call on an audio thread, and a nap gathers messages for one write. Otherwise it
-// sleeps, and the next send() wakes it by one system call, so that an idle program has no wake-ups.
+// How the worker learns of a message. For 50 milliseconds after a message it looks into the ring
+// again and again, after naps of a few milliseconds: a nap gathers messages for one write, and
+// send() makes no system call. Then it sleeps, so that an idle program has no wake-ups, and the
+// next send() wakes it by one system call. With Options::isRealTime it naps as long as a session
+// runs, for 10 milliseconds at most.
 //
 // A flush that finds the worker asleep does its work on its own thread, for two milliseconds at
 // most: two changes of threads cost more than the request. `turn_` says whose turn it is. What can

@@ -64,6 +64,10 @@ struct Options {
   // How long a client whose connection ended tries only the same place. A service that is being
   // restarted must not lose its clients to another one.
   std::chrono::milliseconds samePlaceFor{10'000};
+  // For programs that send from audio threads. While a session runs, the client's thread then looks
+  // for messages by itself, up to a thousand times a second, but a hundred times if none come, and
+  // no send() has to wake it by a system call.
+  bool isRealTime = false;
 };
 
 // How many messages have had which outcome: accepted = acknowledged + refused + lost + pending.
@@ -88,8 +92,8 @@ struct Counters {
 //
 // Any thread may call. send() encodes the message on the caller's thread, and keeps nothing of it.
 // It never blocks, takes no lock, allocates nothing and does not wait for the service, so an audio
-// thread may call it. While the client has a running session, or has sent a message within the last
-// second, send() makes no system call either; otherwise it makes one, to wake the client's thread.
+// thread may call it. It makes one system call, to wake the client's thread, if no message was sent
+// for 50 ms; with Options::isRealTime it makes none while a session runs.
 // The other operations may wait for a lock for a moment.
 // After fork(), a client works only in the process that made it. In a child flush() returns false
 // at once, and destruction leaves the connection to the parent.

@@ -140,6 +140,7 @@ class RealTimeTest : public testing::Test {
     halvox_options options{};
     options.size = sizeof options;
     options.socket_path = path.c_str();
+    options.real_time = 1;
     client_.reset(halvox_client_new(&options));
     message_.reset(halvox_dictionary_new());
     halvox_dictionary_set_int64(message_.get(), "frame_counter", 1);

@@ -108,6 +108,7 @@ client::Options makeOptions(const halvox_options* given) {
   use(options.requestTimeout, full.request_timeout_ms);
   use(options.reconnectMin, full.reconnect_min_ms);
   use(options.reconnectMax, full.reconnect_max_ms);
+  options.isRealTime = full.real_time != 0;
   return options;
 }
 

@@ -230,6 +230,7 @@ typedef struct halvox_options {
   uint32_t request_timeout_ms;   /* how long making a connection may take; 0: 5000 */
   uint32_t reconnect_min_ms;     /* first pause between attempts to connect; 0: 50 */
   uint32_t reconnect_max_ms;     /* longest pause, after several attempts; 0: 2000 */
+  uint64_t real_time;            /* not 0: for audio threads, see halvox_client_send() */
 } halvox_options;
 
 /* How many messages have had which outcome: accepted = acknowledged + refused + lost + pending. */
@@ -298,9 +299,10 @@ HALVOX_API halvox_result halvox_client_destroy_session(halvox_client* client, in
  * a domain, `type` is a HALVOX_EVENT_... number.
  *
  * An audio thread may call the send functions: they encode the message, keep nothing of it, and
- * never block, allocate, take a lock or wait for the service. While the client has a running
- * session, or has sent a message within the last second, they make no system call either; otherwise
- * they make one, to wake the client's thread. */
+ * never block, allocate, take a lock or wait for the service. If no message was sent for 50 ms,
+ * they make one system call, to wake the client's thread. With the option `real_time` they make
+ * none while a session runs: the thread then looks for messages by itself, at least a hundred times
+ * a second. */
 HALVOX_API halvox_result halvox_client_send(halvox_client* client, int64_t id,
                                             const halvox_dictionary* message, uint32_t category,
                                             uint16_t type);

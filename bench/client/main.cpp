@@ -115,6 +115,7 @@ Client makeClient(const std::string& socketPath) {
   halvox_options options{};
   options.size = sizeof options;
   options.socket_path = socketPath.c_str();
+  options.real_time = 1;  // what is measured is what an audio thread pays
   Client client(halvox_client_new(&options));
   halvox_client_create_session(client.get(), kReporter);
   halvox_client_start(client.get(), kReporter);
