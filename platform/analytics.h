@@ -24,8 +24,8 @@ class AnalyticsService {
  public:
   virtual ~AnalyticsService() = default;
 
-  // Whether anyone collects events of that name. It is asked for every message, so it must be
-  // cheap.
+  // Whether anyone collects events of that name. It must be cheap, because it is called for every
+  // message.
   [[nodiscard]] virtual bool isAnalyticsEventUsed(std::string_view eventName) = 0;
 
   // Records one event. Events of one thread are recorded in the order of its calls. The call never

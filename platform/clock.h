@@ -18,7 +18,8 @@ struct LocalTime {
   friend bool operator==(const LocalTime&, const LocalTime&) = default;
 };
 
-// The clocks of the platform. Everything that depends on time asks here, so that tests can move it.
+// The clocks of the platform. Everything that depends on time reads it here, so that tests can set
+// it.
 //
 // Any thread may call; nothing blocks and nothing fails. The composition root owns the service.
 class ClockService {

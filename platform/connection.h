@@ -78,8 +78,8 @@ struct Invocation {
 enum class MethodEffect : std::uint8_t { kMayHoldMore, kHoldsNoMore, kMakesSession };
 
 // Who may make a request: anyone who can connect, or only the owner, which is root or the user that
-// the service runs as. The connection decides by the credentials that the kernel or the bus has of
-// the other end, never by what a message says. It answers a request that is not allowed with
+// the service runs as. The connection decides by the credentials that the kernel or the bus reports
+// for the other end, never by what a message says. It answers a request that is not allowed with
 // org.freedesktop.DBus.Error.AccessDenied; the object never sees it.
 enum class MethodAccess : std::uint8_t { kAnybody, kOwner };
 
@@ -132,7 +132,7 @@ class NSXPCConnection {
   virtual void setInterruptionHandler(std::function<void()> handler) = 0;
   // Called once, after all other calls: the connection has ended and does not come back.
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
-  // Starts delivery. Requests arrive from the thread's next turn on, never inside this call.
+  // Starts delivery. Requests arrive in later turns of the thread's loop, never inside this call.
   virtual void resume() = 0;
 };
 

@@ -17,8 +17,8 @@ using Job = std::function<void()>;
 // utility and background work, which therefore runs at a lower scheduling priority.
 enum class QualityOfService : std::uint8_t { kUserInteractive, kUtility, kBackground };
 
-// What a serial queue runs on: a thread of its own, or the pool that all shared queues use. An own
-// thread is for a queue that blocks or that must never wait for others.
+// What a serial queue runs on: a thread of its own, or the pool that all shared queues use. A queue
+// that blocks, or that must never wait for others, needs a thread of its own.
 enum class QueueThreading : std::uint8_t { kOwnThread, kShared };
 
 // Whether a job can block (on a file, a server or another queue). A brief job cannot, which allows
@@ -47,8 +47,8 @@ class DispatchQueue {
  public:
   virtual ~DispatchQueue() = default;
 
-  // Adds a job and returns at once. The job never runs inside this call, so the caller may hold a
-  // lock that the job takes.
+  // Adds a job and returns at once. The job never runs inside this call. The caller may therefore
+  // hold a lock that the job takes.
   virtual void async(JobWeight weight, Job job) = 0;
   // Waits on a semaphore of the same service without holding a thread. Only for jobs of shared
   // queues: a job of this queue calls it at most once, as the last thing that it does. The queue

@@ -12,10 +12,10 @@
 namespace halvox::platform {
 
 // One file of indented JSON text that is written piece by piece. It appears under its name when it
-// is complete, or not at all, so a reader never sees half a summary.
+// is complete, or not at all. A reader therefore never sees half a summary.
 //
 // The caller owns it and uses it on one thread. Destroying it before commit() removes what was
-// written. Writing in pieces saves a second copy of a large history in memory.
+// written. Writing in pieces avoids a second copy of a large history in memory.
 class JsonArrayFile {
  public:
   virtual ~JsonArrayFile() = default;

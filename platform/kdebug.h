@@ -6,8 +6,8 @@ namespace halvox::platform {
 
 // Trace points: marks in the system trace that cost next to nothing while nobody records them.
 //
-// Any thread may call. A mark that no tracer records is lost without a sign. The composition root
-// owns the service.
+// Any thread may call. A mark that no tracer records is lost silently. The composition root owns
+// the service.
 class KdebugService {
  public:
   virtual ~KdebugService() = default;

@@ -42,8 +42,8 @@ class KtraceSession {
 //
 // Failure: a start that fails still counts as a start. A call that does not suit the session's
 // state does nothing; neither does a call without a session or after its destruction. Calls with a
-// result return an error then. Requests of clients can cause all of these, so they must be
-// harmless.
+// result return an error then. All of these must be harmless, because requests of clients can cause
+// them.
 //
 // The composition root owns the service.
 class KtraceService {

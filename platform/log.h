@@ -20,9 +20,9 @@ std::string_view levelName(LogLevel level);
 
 // One category of the log.
 //
-// The log service makes it once and keeps it for the life of the process, so callers keep a
-// reference. Any thread may use it. A disabled level costs a load and a branch; debug lines can
-// therefore stay on the hot path.
+// The log service makes it once and keeps it for the life of the process. Callers keep a reference.
+// Any thread may use it. A disabled level costs a load and a branch; debug lines can therefore stay
+// on the hot path.
 class LogCategory {
  public:
   virtual ~LogCategory() = default;
@@ -119,7 +119,7 @@ class UnitLog {
   }
   [[nodiscard]] bool isDebugEnabled() const { return category_().isEnabled(LogLevel::kDebug); }
 
-  // The same for a unit whose caller chooses the category.
+  // Logs a line for a unit whose caller chooses the category and the level.
   template <typename... Parts>
   static void logTo(LogCategory& category, std::string_view unit, LogLevel level, const Text& text,
                     const Parts&... parts) {

@@ -34,7 +34,7 @@ class ObjectLog {
   void error(const UnitLog::Text& text, const Parts&... parts) const {
     UnitLog::logTo(*category_, unit_, LogLevel::kError, text, parts...);
   }
-  // The same at a level that the caller chooses.
+  // Logs a line at a level that the caller chooses.
   template <typename... Parts>
   void log(LogLevel level, const UnitLog::Text& text, const Parts&... parts) const {
     UnitLog::logTo(*category_, unit_, level, text, parts...);

@@ -45,8 +45,8 @@ class KQTraceSession {
  public:
   virtual ~KQTraceSession() = default;
 
-  // Keeps the delegate weakly. None ends the calls: a trace that was replaced must not answer for
-  // its successor.
+  // Keeps a weak reference to the delegate. An empty pointer ends the calls: a trace that was
+  // replaced must not answer for its successor.
   virtual void setDelegate(std::weak_ptr<KQTraceSessionDelegate> delegate) = 0;
   // Both return at once, whatever the tracer does, and are carried out in the order of the calls.
   // The delegate learns how they ended.

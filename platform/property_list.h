@@ -9,7 +9,7 @@
 
 namespace halvox::platform {
 
-// Reads property-list files. Clients name the files, so nothing in them is trusted.
+// Reads property-list files. Nothing in the files is trusted, because clients name them.
 //
 // Any thread may call; reading waits for the disk. A failure sets `error`. The composition root
 // owns the service.

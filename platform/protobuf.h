@@ -46,7 +46,8 @@ enum class ProtoWireType : std::uint8_t {
 // beyond the bytes is ever read.
 class ProtoReader {
  public:
-  // The number has 64 bits, although valid ones fit into 29: malformed bytes may hold any.
+  // The field number has 64 bits, although valid ones fit into 29: malformed bytes may contain any
+  // number.
   struct Tag {
     std::uint64_t number;
     ProtoWireType wireType;
@@ -60,9 +61,9 @@ class ProtoReader {
   // True while the end is not reached and nothing has failed.
   [[nodiscard]] bool hasMore() const { return position_ < end() && !error_; }
 
-  // The varint at the position. One that the end cuts off sets the error flag and reads as 0. One
-  // that continues after ten bytes, which is more than 64 bits need, reads as 0 without an error,
-  // and decoding continues after the ten bytes. The difference is required.
+  // The varint at the position. A varint that the end cuts off sets the error flag and reads as 0.
+  // A varint of more than ten bytes, which no 64-bit number needs, reads as 0 without an error, and
+  // decoding continues after the ten bytes. The difference is required.
   [[nodiscard]] std::uint64_t readVarint();
   [[nodiscard]] Tag readTag();
   // Copies the string at the position to `value`. If the string is longer than the remaining bytes,

@@ -33,7 +33,7 @@ Varint readVarint(const Bytes& bytes) {
   return {value, reader.hasError(), reader.position()};
 }
 
-// Whether the value is skipped, wholly.
+// Whether the value is skipped completely.
 bool skips(std::uint64_t number, ProtoWireType wireType, const Bytes& bytes) {
   ProtoReader reader(span(bytes));
   const bool skipped = reader.skipField(number, wireType);
@@ -100,7 +100,7 @@ TEST(ProtoReaderTest, ValuesOfEveryWireTypeAreSkipped) {
   EXPECT_TRUE(skips(9, ProtoWireType::kFixed64, Bytes(8, 0xFF)));
   EXPECT_TRUE(skips(9, ProtoWireType::kLengthDelimited, {0x02, 0xFF, 0xFF}));
   EXPECT_TRUE(skips(9, ProtoWireType::kFixed32, Bytes(4, 0xFF)));
-  // A group of a varint, a group of a string, and a fixed value.
+  // A group that contains a varint, a group with a string, and a fixed value.
   EXPECT_TRUE(skips(9, ProtoWireType::kStartGroup,
                     {0x08, 0x05, 0x53, 0x12, 0x01, 'x', 0x54, 0x1D, 1, 2, 3, 4, 0x4C}));
 }

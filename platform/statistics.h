@@ -17,8 +17,8 @@ class Counter {
 };
 
 // The service's own bookkeeping: what was received, delivered, suppressed and dropped, by reason.
-// For each piece, received = delivered + suppressed + dropped, so a loss that nobody counted shows
-// as a difference.
+// For each piece, received = delivered + suppressed + dropped. A loss that nobody counted shows as
+// a difference.
 //
 // Any thread may call. The composition root owns the service.
 class StatisticsService {

@@ -17,8 +17,8 @@ using detail::StringRep;
 
 namespace {
 
-// Constants by the length of their text. A text with a length that no constant has costs one look;
-// without the table every decoded string would be compared with every constant.
+// Constants by the length of their text. A text with a length that no constant has costs one
+// look-up; without the table, every decoded string would be compared with every constant.
 constexpr std::size_t kMaxConstantLength = 64;
 using ConstantTable = std::array<StringConstant*, kMaxConstantLength + 1>;
 
@@ -118,7 +118,7 @@ Value::Value(Dictionary dictionary) noexcept {
   setPayload(dictionary.rep_.take());
 }
 
-// Every counted node begins with its reference count, so the kind of node does not matter here. An
+// The kind of node does not matter here: every counted node begins with its reference count. An
 // empty container has no node.
 void Value::retain() const noexcept {
   if (auto* references = payload<detail::ReferenceCount*>()) detail::retain(*references);

@@ -17,8 +17,8 @@ namespace halvox::platform {
 class Array;
 class Dictionary;
 
-// A point in time: seconds since 1970-01-01 00:00 UTC. It comes from clients, so any double is
-// possible, including NaN and the infinities.
+// A point in time: seconds since 1970-01-01 00:00 UTC. Any double is possible, including NaN and
+// the infinities, because dates come from clients.
 struct Date {
   double secondsSince1970 = 0;
   friend bool operator==(const Date&, const Date&) = default;
@@ -100,8 +100,8 @@ class Reference {
 // The key of a dictionary entry: an immutable text. Equal keys share one node, which makes
 // comparing them a comparison of pointers.
 //
-// The table of shared nodes is bounded, because clients choose the keys. A key that finds no place
-// in the table works the same way but owns its text. Any thread may make and copy keys; one key
+// The table of shared nodes is bounded, because clients choose the keys. A key for which the table
+// has no room works the same way but owns its text. Any thread may make and copy keys; one key
 // object belongs to one thread at a time.
 class Key {
  public:
@@ -168,9 +168,9 @@ enum class ValueKind : std::uint8_t { kNone, kNumber, kString, kDate, kData, kAr
 // One property-list value: a number, a string, a date, data, an array or a dictionary.
 //
 // Values are immutable and shared: a copy costs at most one increment of a reference count, and
-// numbers and short strings live in the value itself. Up to six consumers and a history hold the
-// same message, so sharing must be cheap and needs no lock. Different threads may use different
-// copies at once; one value object belongs to one thread at a time.
+// numbers and short strings live in the value itself. Sharing must be cheap and needs no lock,
+// because up to six consumers and a history hold the same message. Different threads may use
+// different copies at once; one value object belongs to one thread at a time.
 //
 // Two values are equal if their contents are equal. Numbers compare by value, whatever type they
 // were made from: 1, 1.0 and true are equal. A NaN equals every NaN, so that a repeated message
@@ -319,13 +319,14 @@ class Array {
 
 // A dictionary from texts to values.
 //
-// Copies share their content until one of them is changed; the change copies the content first, so
-// no holder sees the change of another. Different threads may use different copies at once; one
-// object belongs to one thread at a time.
+// Copies share their content until one of them is changed. The change copies the content first: no
+// holder sees the change of another. Different threads may use different copies at once; one object
+// belongs to one thread at a time.
 //
 // Entries are enumerated in the order in which their keys were first set. A small dictionary is
-// searched key by key, a large one by an index with a secret hash: a client that sends many keys,
-// or keys that collide, costs no more time than their bytes do.
+// searched key by key, a large one by an index with a secret hash. The time that a client's keys
+// cost is therefore proportional to their bytes, even if there are many or they are made to
+// collide.
 class Dictionary {
  public:
   struct Entry {

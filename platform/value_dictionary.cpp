@@ -124,8 +124,8 @@ void Dictionary::makeRoomFor(std::size_t entries) {
   }
   const bool alone = rep_->references.load(std::memory_order_acquire) == 1;
   if (alone && entries <= rep_->capacity) return;
-  // A shared dictionary is usually changed once and then kept, so its copy gets exactly the room
-  // that it needs. One that grows entry by entry grows by half.
+  // The copy of a shared dictionary gets exactly the room that it needs, because it is usually
+  // changed once and then kept. One that grows entry by entry grows by half.
   const std::size_t capacity =
       alone ? std::max<std::size_t>(entries, rep_->capacity + rep_->capacity / 2) : entries;
   Reference grown = allocateRep(capacity);
@@ -194,7 +194,7 @@ std::size_t Dictionary::memorySize() const {
 bool operator==(const Dictionary& left, const Dictionary& right) {
   if (left.rep_ == right.rep_) return true;
   if (left.size() != right.size()) return false;
-  // Repeated messages have their keys in the same order, so the same position is tried first.
+  // Try the same position first: repeated messages have their keys in the same order.
   const Dictionary::Entry* other = right.begin();
   for (const Dictionary::Entry& entry : left) {
     const Value* counterpart = other->key == entry.key ? &other->value : right.find(entry.key);

@@ -274,7 +274,7 @@ TEST(DictionaryTest, KeysThatWereMadeToCollideCostAboutWhatOthersCost) {
       timeToFill([](std::uint64_t number) { return "ordinary " + std::to_string(number); });
   const auto colliding = timeToFill(collidingKey);
 
-  // Comparing each key with all colliding keys would take some hundred times as long.
+  // Comparing each key with all colliding keys would take hundreds of times as long.
   EXPECT_LT(colliding, 20 * ordinary);
 }
 

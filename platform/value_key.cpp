@@ -11,12 +11,12 @@ namespace {
 using detail::KeyNode;
 
 // Interned keys are never freed, and clients choose them: their number must be bounded. Real
-// vocabularies have some hundreds of keys. Long texts are not worth a place.
+// vocabularies have a few hundred keys. Long texts are not worth a slot.
 constexpr std::size_t kMaxInternedKeys = 4096;
 constexpr std::size_t kMaxInternedLength = 128;
 constexpr std::size_t kTableSlots = 4 * kMaxInternedKeys;  // at most a quarter full
-// std::hash has no secret, so a client can choose texts that collide. After this many probes a text
-// is not interned, which bounds the cost of a look-up.
+// A client can choose texts that collide, because std::hash has no secret. After this many probes a
+// text is not interned, which bounds the cost of a look-up.
 constexpr std::size_t kMaxProbes = 16;
 
 KeyNode* makeNode(std::string_view text, std::uint32_t hash, bool interned) {

@@ -32,7 +32,7 @@ class FakeAnalyticsService final : public AnalyticsService {
   explicit FakeAnalyticsService(Journal& journal) : journal_(journal) {}
 
   void wantEverything();
-  // From now on only these names are wanted; with an empty set none is.
+  // Sets the names that are wanted from then on; with an empty set, none is.
   void wantOnly(std::set<std::string, std::less<>> names);
   void setBuilding(Building building);
   // Builds the payloads that have not been built, in the order of sending, on this thread. Releases
@@ -44,7 +44,7 @@ class FakeAnalyticsService final : public AnalyticsService {
   [[nodiscard]] std::vector<Event> events() const;
   [[nodiscard]] std::vector<Event> events(std::string_view name) const;
   [[nodiscard]] std::vector<std::string> sentNames() const;
-  // The names that were asked for, in order.
+  // The names that isAnalyticsEventUsed() was called with, in order.
   [[nodiscard]] std::vector<std::string> testedNames() const;
 
   [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override;

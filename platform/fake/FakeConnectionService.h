@@ -42,9 +42,9 @@ class FakeConnectionService;
 // The user of a fake client's process: root or the service's own user, or another.
 enum class FakeUser : unsigned char { kOwner, kStranger };
 
-// A client's connection in the hands of the test, which sends requests, interrupts and disconnects.
-// Everything runs on the test's thread, which stands for the connection's thread. Shared by the
-// test and, until it is invalidated, by the service.
+// A client's connection that the test controls: the test sends requests, interrupts and
+// disconnects. Everything runs on the test's thread, which stands for the connection's thread.
+// Shared by the test and, until it is invalidated, by the service.
 class FakeConnection final : public NSXPCConnection {
  public:
   static constexpr std::size_t kMaxReporterIDs = 10'000;  // for one request; the default limit
@@ -59,7 +59,7 @@ class FakeConnection final : public NSXPCConnection {
   std::shared_ptr<FakeCall> call(std::string_view method, std::vector<Value> arguments = {});
   // The other end has gone, but the connection might come back.
   void interrupt();
-  // The connection has ended for good: calls the handler once, then releases the exported object.
+  // Ends the connection: calls the invalidation handler once, then releases the exported object.
   void invalidate();
 
   // The number of requests that have not been carried out.

@@ -39,7 +39,7 @@ class FakeDiagnosticReporterService final : public DiagnosticReporterService {
   // The state of the service from the source that was set; none if there is no source, or if it did
   // not answer before it returned.
   [[nodiscard]] std::optional<Dictionary> state() const;
-  // The same for a source that answers later. Does nothing without a source.
+  // Asks the source for the state, for a source that answers later. Does nothing without a source.
   void askState(std::function<void(const Dictionary& state)> callback) const;
 
   [[nodiscard]] std::shared_ptr<AILDiagnosticReporter> createReporter() override;

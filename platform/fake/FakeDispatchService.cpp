@@ -7,8 +7,7 @@
 namespace halvox::platform {
 namespace {
 
-// What this thread is running: whether it runs a job, and of which queue; null for the background
-// queue.
+// Whether this thread runs a job, and the queue of that job; null for the background queue.
 thread_local bool runningJob = false;
 thread_local FakeDispatchQueue* runningQueue = nullptr;
 
@@ -108,7 +107,8 @@ void FakeDispatchService::advance(std::chrono::nanoseconds by) {
   moveTimeTo(until);
 }
 
-// Moves to the next delayed job or end of a wait. Returns false if there is none up to that time.
+// Moves time to the next delayed job or end of a wait. Returns false if there is none up to
+// `until`.
 bool FakeDispatchService::passNext(std::chrono::nanoseconds until) {
   std::chrono::nanoseconds time{};
   Job job;

@@ -28,8 +28,8 @@ class FakeFileService final : public FileService {
   // Does not own the journal, which must outlive it.
   explicit FakeFileService(Journal& journal) : journal_(journal) {}
 
-  // From now on directories cannot be made, or files cannot be committed, with that error; none
-  // ends it. A directory that could not be made still counts as existing, so that a test can tell
+  // Makes the creation of directories, or the commit of files, fail with that error; none ends the
+  // failures. A directory that could not be made still counts as existing, so that a test can tell
   // the two failures apart.
   void setDirectoryError(std::optional<Error> error);
   void setFileError(std::optional<Error> error);
@@ -54,7 +54,7 @@ class FakeFileService final : public FileService {
   mutable std::mutex mutex_;
   std::optional<Error> directoryError_;
   std::optional<Error> fileError_;
-  std::set<std::string> known_;  // all directories that were to be made
+  std::set<std::string> known_;  // all directories that a call was to make
   std::map<std::string, std::uint32_t> directories_;
   std::vector<File> files_;
   std::vector<std::string> steps_;

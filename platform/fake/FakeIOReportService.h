@@ -43,18 +43,17 @@ class FakeIOReportService final : public IOReportService {
   // Does not own the journal, which must outlive it.
   explicit FakeIOReportService(Journal& journal) : journal_(journal) {}
 
-  // From now on the group exists and its channels have these values. Set it again to change the
-  // values.
+  // Creates the group with these channels and values, or replaces its channels and values.
   void setGroup(std::string_view name, ChannelList channels);
-  // Installs a function that runs after each group's samples, like a driver that counts meanwhile;
-  // null removes it.
+  // Installs a function that runs after each group's samples, to simulate a driver that counts
+  // meanwhile; null removes it.
   void afterSamples(std::function<void(const std::string& group)> change);
-  // From now on the operation fails for that group.
+  // Makes the operation fail for that group.
   void failChannels(std::string_view name, Failure failure);
   void failSubscription(std::string_view name, Failure failure);
   void failSamples(std::string_view name, Failure failure);
   void failDelta(std::string_view name, Failure failure);
-  // From now on looking for the group's channels returns an error together with the channels.
+  // Makes the search for the group's channels return an error together with the channels.
   void addErrorToChannels(std::string_view name, std::int64_t code);
 
   Channels IOReportCopyChannelsInGroup(Name group, Name subGroup,

@@ -25,19 +25,19 @@ class FakeKtraceService final : public KtraceService {
   // Does not own the journal, which must outlive it.
   explicit FakeKtraceService(Journal& journal) : journal_(journal) {}
 
-  // Gives these events to each session, as far as its ranges allow, before the ones that it
-  // recorded.
+  // Delivers those of these events that are in a session's ranges to that session, before the
+  // events that it recorded.
   void setEvents(std::vector<trace_point> events);
-  // Emits an event: the sessions that record now keep it, as far as their ranges allow.
+  // Emits an event: the sessions that record now keep it if it is in their ranges.
   void emit(const trace_point& event);
   void setNanosecondsPerTick(std::uint64_t nanoseconds) { setTimebase(nanoseconds, 1); }
   // That number of ticks takes that number of nanoseconds. Fractions of a nanosecond are cut off.
   void setTimebase(std::uint64_t nanoseconds, std::uint64_t ticks);
-  // From now on these calls fail with that error; 0 ends it.
+  // Makes these calls fail with that error; 0 ends the failures.
   void failRange(int error);
   void failStart(int error);
-  // Installs a function that each start calls first, on its thread: a tracer that is slow to start.
-  // Call it before the first start.
+  // Installs a function that each start calls first, on its thread, to simulate a tracer that
+  // starts slowly. Call it before the first start.
   void setTracerDelay(std::function<void()> delay) { delay_ = std::move(delay); }
   // The number of sessions that record now.
   [[nodiscard]] std::size_t recordings() const;

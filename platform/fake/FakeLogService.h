@@ -10,9 +10,9 @@
 
 namespace halvox::platform {
 
-// Keeps every log line. Code under test keeps categories in static variables, so categories live as
-// long as the process and write to the newest fake log service. At first every level is wanted. Any
-// thread may log. FakePlatform owns it.
+// Keeps every log line. Categories live as long as the process and write to the newest fake log
+// service, because code under test keeps them in static variables. At first every level is wanted.
+// Any thread may log. FakePlatform owns it.
 class FakeLogService final : public LogService {
  public:
   struct Line {

@@ -17,7 +17,7 @@ class FakeNotifyService final : public NotifyService {
  public:
   static constexpr NotifyStatus kInvalidName = 1;  // for a name that cannot exist
 
-  // From now on registrations of that name fail with that status.
+  // Makes registrations of that name fail with that status.
   void failRegistration(std::string_view name, NotifyStatus status);
   // Adds the handlers of that name to their queues, in the order of registration.
   void post(std::string_view name);

@@ -14,28 +14,28 @@
 
 namespace halvox::platform {
 
-// Performance traces that record nothing. They succeed unless the test decides otherwise. Delegates
-// are called by jobs of the service's own queue, so nothing is reported before the test runs jobs.
-// What sessions are asked for is in the journal. Any thread may call. FakePlatform owns it.
+// Performance traces that record nothing. They succeed unless the test decides otherwise. Jobs of
+// the service's own queue call the delegates: nothing is reported before the test runs jobs. The
+// journal has the calls that sessions receive. Any thread may call. FakePlatform owns it.
 class FakePerformanceTraceService final : public PerformanceTraceService {
  public:
   // Owns neither; both must outlive it and its sessions.
   FakePerformanceTraceService(Journal& journal, DispatchService& dispatch)
       : journal_(journal), dispatch_(dispatch) {}
 
-  // From now on, with that description: starts fail; recordings fail when they are stopped;
-  // finished traces cannot be saved. An empty description ends it.
+  // Make starts, the stops of recordings, or the saving of finished traces fail with that
+  // description. An empty description ends the failures.
   void failStarts(std::string description);
   void failStops(std::string description);
   void failSaves(std::string description);
-  // From now on starts and stops are never answered, as with a recorder that hangs.
+  // Leaves later starts and stops without an answer, like a recorder that hangs.
   void hang();
-  // Sets the URL of the traces that complete from now on. Otherwise each has its own.
+  // Sets the URL of all traces that complete later. Without it, each trace has a URL of its own.
   void completeAtStop(std::string url);
 
   // The delegate of the newest session; null if it has none.
   [[nodiscard]] std::shared_ptr<KQTraceSessionDelegate> delegate() const;
-  // The numbers of the templates that were asked for.
+  // The numbers of the templates that were requested.
   [[nodiscard]] std::vector<std::int32_t> templates() const;
   // The number of sessions that record now.
   [[nodiscard]] std::size_t recordings() const;

@@ -10,14 +10,14 @@
 
 namespace halvox::platform {
 
-// Property-list files that the test makes. The bytes of a file are the number of its content; bytes
-// that were read therefore keep their meaning after the file has changed. Any thread may call.
-// FakePlatform owns it.
+// Property-list files that the test makes. The bytes of a file are the index of its content. Bytes
+// that were read before the file changed therefore still stand for the old content. Any thread may
+// call. FakePlatform owns it.
 class FakePropertyListService final : public PropertyListService {
  public:
-  // From now on the file contains a property list with that root.
+  // Makes the file contain a property list with that root.
   void setFile(std::string path, Value root);
-  // From now on the file can be read, but is not a property list.
+  // Makes the file readable, but not a property list.
   void setBrokenFile(std::string path);
   void setCurrentDirectory(std::string path);
 

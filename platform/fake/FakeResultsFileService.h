@@ -36,9 +36,9 @@ class FakeResultsFileService final : public ResultsFileService {
   // Does not own the journal, which must outlive it.
   explicit FakeResultsFileService(Journal& journal) : journal_(journal) {}
 
-  // From now on no file can be opened.
+  // Makes the opening of every file fail.
   void failToOpen();
-  // The same for that path alone.
+  // Makes the opening of that file fail.
   void failToOpen(std::string path);
   // All files that were begun, in order.
   [[nodiscard]] std::vector<File> files() const;

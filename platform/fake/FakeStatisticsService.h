@@ -30,7 +30,7 @@ class FakeStatisticsService final : public StatisticsService {
   };
 
   mutable std::mutex mutex_;
-  // Elements of a map do not move, so references to counters stay valid.
+  // A map, because its elements do not move: references to counters stay valid.
   std::map<std::pair<std::string, std::string>, Count> counts_;
 };
 

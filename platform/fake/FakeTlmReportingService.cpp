@@ -75,7 +75,7 @@ void FakeTlmReportingService::setOutcome(TLMReportingOutcome outcome) {
 }
 
 void FakeTlmReportingService::clear() {
-  std::deque<BackendsCallback> discoveries;  // destroyed without the lock: callbacks own things
+  std::deque<BackendsCallback> discoveries;  // destroyed without the lock: callbacks own objects
   std::deque<std::function<void()>> flushes;
   const std::lock_guard lock(mutex_);
   discoveries.swap(waitingDiscoveries_);

@@ -44,8 +44,8 @@ class FakeTlmReportingService final : public TLMReportingService {
   FakeTlmReportingService(Journal& journal, FakeDispatchService& dispatch)
       : journal_(journal), dispatch_(dispatch) {}
 
-  // From now on discoveries are answered in this way, with these back-ends. With kWhenTold the test
-  // gives the back-ends with each answer.
+  // Sets how later discoveries are answered, and with which back-ends. With kWhenTold, the test
+  // passes the back-ends with each answer.
   void answerDiscoveries(Answering answering, std::optional<Array> backends = std::nullopt);
   // Answers the oldest discovery, on this thread. Returns false if none waits.
   bool answerDiscovery(const std::optional<Array>& backends);
@@ -53,7 +53,7 @@ class FakeTlmReportingService final : public TLMReportingService {
   void answerFlushes(Answering answering);
   // Ends the oldest flush, on this thread. Returns false if none waits.
   bool completeFlush();
-  // From now on this is the outcome of messages, inside and outside of sessions.
+  // Sets the outcome of later messages, inside and outside of sessions.
   void setOutcome(TLMReportingOutcome outcome);
   // Drops the callbacks that were not called.
   void clear();

@@ -12,12 +12,12 @@ namespace halvox::platform {
 enum class JournalKind : unsigned char {
   kLogLine,          // text: the line without its prefix
   kTracePoint,       // text: the code as "0x21044828"
-  kAnalyticsTest,    // text: the name that was asked for
+  kAnalyticsTest,    // text: the name that was tested
   kAnalyticsEvent,   // text: the name that was sent
   kMetric,           // text: the metric's identifier in decimal digits
   kPowerEvent,       // text: the event's name
   kSnapshotRequest,  // text: the signature's description
-  kLink,             // text: what the real-time framework was asked for, as "send session 1 4/1"
+  kLink,             // text: the call of the real-time framework, as "send session 1 4/1"
   kFile,             // text: the call for a directory or file, as "file /a/b.json"
   kReply,            // text: the name of the method that was answered
   kTermination,      // text: the exit status
@@ -44,9 +44,9 @@ class Journal {
   void whenRecorded(std::function<void(const JournalEntry&)> handler);
 
   [[nodiscard]] std::vector<JournalEntry> entries() const;
-  // The entries of the kinds named, in their order.
+  // The entries of these kinds, in the order of recording.
   [[nodiscard]] std::vector<JournalEntry> entries(std::initializer_list<JournalKind> kinds) const;
-  // The texts of all entries, or of those of one kind, in their order.
+  // The texts of all entries, or of the entries of one kind, in the order of recording.
   [[nodiscard]] std::vector<std::string> texts() const;
   [[nodiscard]] std::vector<std::string> texts(JournalKind kind) const;
 

@@ -14,8 +14,8 @@ ConnectionOptions connectionOptions(const Configuration& configuration) {
   ConnectionOptions options;
   options.socket = configuration.listener.socket;
   options.socketAccess = {configuration.listener.mode, configuration.listener.group};
-  // Only that of the default socket, which nobody may have made in a fresh login. The directory of
-  // a configured path is the administrator's.
+  // Make only the directory of the default socket: after a fresh login it may not exist. The
+  // administrator makes the directory of a configured path.
   options.makeSocketDirectory = configuration.listener.socket == defaultSocketPath();
   options.bus = configuration.listener.bus;
   options.starter = starterBus();
@@ -43,7 +43,8 @@ SnapshotOptions snapshotOptions(const Configuration& configuration) {
   return options;
 }
 
-// A service without trace points serves all the same. The reason is logged at the start.
+// If trace points are not available, the service runs without them and logs the reason at the
+// start.
 std::unique_ptr<KdebugService> makeKdebug(std::string& failure) {
   auto loaded = LttngKdebugService::load();
   if (loaded) return *std::move(loaded);
@@ -80,7 +81,8 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
               dispatch.beginHelping();
             };
             options.endBatch = [this] { dispatch.endHelping(); };
-            // A client's answer should not wait until other threads are woken.
+            // Wake the pool only after the replies: a client should not wait while other threads
+            // are woken.
             options.afterReplies = [this] { dispatch.wakePool(); };
             options.onReportSignal = std::move(onReportSignal);
             return options;

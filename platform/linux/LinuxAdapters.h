@@ -37,8 +37,8 @@
 namespace halvox::platform::linux_ {
 
 // Every adapter of one process, in the order in which they need each other. Belongs to
-// LinuxPlatform, which opens and closes them. Its many includes are the reason for the header: only
-// the two sources that compose the service read it.
+// LinuxPlatform, which opens and closes them. It has a header of its own because of its many
+// includes: only the two sources that compose the service include it.
 struct LinuxAdapters {
   // Starts the threads of the log and of the queues; nothing outside the process is touched yet.
   // `onReportSignal` runs on the main thread for each SIGUSR1.

@@ -14,7 +14,7 @@ namespace {
 
 // How long the end of the service waits for jobs that run.
 constexpr std::chrono::seconds kJobsEndWithin{5};
-// How long it lets the queues of sessions run what they have before that.
+// How long it waits before that while the queues of sessions run their jobs.
 constexpr std::chrono::seconds kQueuesFinishWithin{5};
 
 const char* linkName(LinkBackend backend) {
@@ -79,10 +79,10 @@ Result<void, int> LinuxPlatform::open() {
   if (!adapters_->natsFailure.empty()) {
     return Failure<int>{EX_CONFIG, "link.backend = \"nats\" needs " + adapters_->natsFailure};
   }
-  // The store before the sockets: whatever is accepted can then be kept.
+  // Open the store before the sockets, so that everything that is accepted can be stored.
   if (const auto opened = adapters_->store.open(); !opened) return startFailure(opened.error());
-  // After the store, whose lock shows that no other service uses the directory: what is removed
-  // here could be in use.
+  // Only after opening the store, whose lock shows that no other service uses the directory:
+  // another service could still use the files that are removed here.
   adapters_->diagnosticReporters.removeLeftovers();
   adapters_->traces->open();
   adapters_->ioReport.open();
@@ -94,13 +94,13 @@ Result<void, int> LinuxPlatform::open() {
 }
 
 bool LinuxPlatform::close() {
-  // First what adds jobs to the queues: captures reply through them.
+  // First stop what adds jobs to the queues: captures reply through them.
   adapters_->diagnosticReporters.stop();
   adapters_->notify.stop();  // it adds jobs to queues
   // Before the queues: a stop of a session may wait for a trace that is still being read.
   adapters_->traces->stop();
   // A message that was answered without an error reaches the link, and its queue still holds it.
-  // These queues have a lower priority than requests, so some of their jobs may still wait.
+  // Some jobs of these queues may still wait, because they have a lower priority than requests.
   adapters_->dispatch.finish(kQueuesFinishWithin);
   const bool ended = adapters_->dispatch.stop(kJobsEndWithin);
   ended ? adapters_->traces->close() : adapters_->traces->abandon();

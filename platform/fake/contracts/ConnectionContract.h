@@ -70,8 +70,8 @@ class ContractObject final : public ExportedObject {
   ReplyCallback kept_;
 };
 
-// The object's methods; each takes one text. "echo" answers it, "keep" answers later, "fail"
-// answers an error, "end" is for the owner and answers it.
+// The object's methods. Each takes one text. "echo" returns it, "keep" answers later, "fail"
+// returns an error, and "end", which only the owner may call, returns the text.
 inline const NSXPCInterface& contractInterface() {
   constexpr auto kEcho = +[](ExportedObject& object, Invocation&& request) {
     static_cast<ContractObject&>(object).see(request);

@@ -24,7 +24,7 @@ namespace halvox::platform::contract {
 //     lets a program emit these events in this order, each later than the one before; recordings
 //     have them when this returns
 //   std::size_t recordings();  the number of recordings in the tracer
-//   void breakTracer();        lets no recording begin; called before the first start
+//   void breakTracer();        prevents recordings from starting; called before the first start
 template <typename Harness>
 class KtraceContract : public ::testing::Test {
  protected:

@@ -39,7 +39,7 @@ class NotifyContract : public ::testing::Test {
         });
     return listener;
   }
-  // Posts the name until the listener was called that often, one post after the other.
+  // Posts the name, one post after the other, until the listener has been called `calls` times.
   bool letHear(const Listener& listener, const std::string& name, int calls) {
     for (int call = listener.calls + 1; call <= calls; ++call) {
       harness_.post(name);

@@ -21,7 +21,7 @@ namespace halvox::platform::contract {
 //   bool letRunUntil(const std::function<bool()>& condition);
 //     lets the service work until the condition holds; false if it never does
 //   std::size_t recordings();  the number of recordings in the tracer
-//   void breakTracer();        lets no recording begin
+//   void breakTracer();        prevents recordings from starting
 //   void breakRecorder();      makes the end of the current recordings fail
 //   void breakSaving();        makes saving a finished trace fail
 template <typename Harness>
@@ -30,7 +30,7 @@ class PerformanceTraceContract : public ::testing::Test {
   using Texts = std::vector<std::string>;
   using Session = std::shared_ptr<KQTraceSession>;
 
-  // Notes its calls.
+  // Keeps the names of its calls.
   class Listener final : public KQTraceSessionDelegate {
    public:
     void kqTraceDidStart(const std::optional<Error>& error) override {
@@ -94,7 +94,7 @@ class PerformanceTraceContract : public ::testing::Test {
     EXPECT_EQ(listener->heard(), texts);
     return isHeard;
   }
-  // Starts another trace. Its outcome comes after everything that was asked for before.
+  // Starts another trace. Its outcome comes after the outcomes of all earlier calls.
   void letWorkPass() {
     const auto other = std::make_shared<Listener>();
     const Session session = create(other);

@@ -21,7 +21,7 @@ namespace halvox::platform::contract {
 //   static constexpr bool kFindsBackends;   // whether a discovery finds any
 //   static constexpr bool kTakesMessages;   // whether a message is taken
 //   std::vector<std::int64_t> arrived();    // the numbers of the servers' messages, in order
-//   void breakSending();                    // from now on messages are not taken
+//   void breakSending();                    // makes the service refuse messages
 // and, if it needs a server, static bool isAvailable(); without the server the suite is skipped.
 template <typename Harness>
 class TlmReportingContract : public ::testing::Test {
@@ -114,7 +114,7 @@ TYPED_TEST_P(TlmReportingContract, ADiscoveryIsAnsweredLaterAndNotFromInsideTheC
   EXPECT_EQ(discovery->backends.has_value(), TypeParam::kFindsBackends);
 }
 
-// Also for a framework that remembers the first discovery.
+// Must also hold for a framework that remembers the result of the first discovery.
 TYPED_TEST_P(TlmReportingContract, LaterDiscoveriesAreNotAnsweredFromInsideTheCallEither) {
   const auto session = this->openSession(1);
 

@@ -20,8 +20,8 @@ class NoKdebugService final : public KdebugService {
 // Emits trace points as LTTng events "halvox:kdebug" with the fields code and arg1 to arg4.
 //
 // The LTTng provider is a module that is loaded at run time. LTTng then has two threads in the
-// process. They sleep until a session daemon starts, so they cost no wake-up, and a daemon that
-// starts later finds the service too. Loading does not wait for a daemon, not even for one that
+// process. They sleep until a session daemon starts, which costs no wake-up, and a daemon that
+// starts later also finds the service. Loading does not wait for a daemon, not even for one that
 // hangs.
 //
 // Any thread may call. The platform owns it. The module stays loaded until the process ends,

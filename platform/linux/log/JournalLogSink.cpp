@@ -29,8 +29,8 @@ int priority(LogLevel level) {
   return LOG_ERR;
 }
 
-// Sends each line as one entry of named fields. Entries go into the buffer of journald's socket, so
-// write() blocks only while journald itself hangs; finish() needs no action.
+// Sends each line as one entry of named fields. Entries go into the buffer of journald's socket:
+// write() blocks only while journald itself hangs. finish() needs no action.
 class JournalLogSink final : public LogSink {
  public:
   explicit JournalLogSink(JournalSender sender) : sender_(std::move(sender)) {}

@@ -14,7 +14,8 @@ LogMemory::LogMemory(LogLevel level, Bounds bounds)
 void LogMemory::add(const LogEntry& entry, std::string_view line) {
   const MutexLock lock(mutex_);
   line = line.substr(0, bounds_.bytes);
-  // A text is never split: if it does not fit before the end of the ring, that rest stays unused.
+  // A text is never split: if it does not fit before the end of the ring, the rest of the ring
+  // stays unused.
   const std::uint64_t room = bounds_.bytes - end_ % bounds_.bytes;
   if (room < line.size()) end_ += room;
   // Drop the lines that the new text overwrites, and those in the unused rest.

@@ -25,7 +25,7 @@ bool LogQueue::add(LogEntry entry) {
     entries_.push_back(std::move(entry));
     bytes_ += cost;
   }
-  // Only the first: the log's thread takes all entries before it sleeps.
+  // Only the first entry wakes the log's thread, which takes all entries before it sleeps.
   if (isFirst) wakeUp_.notifyOne();
   return true;
 }
@@ -38,7 +38,7 @@ bool LogQueue::take(std::vector<LogEntry>& entries) {
     if (hasEnded_) return false;
     wakeUp_.wait(mutex_);
   }
-  // All at once: the lock is held for a moment, however long the lines take to write.
+  // Take all lines at once: the lock is held only for a moment, however long writing them takes.
   entries.swap(entries_);
   bytes_ = 0;
   return true;

@@ -24,8 +24,9 @@ struct LogEntry {
 };
 
 // The queue between the threads that log and the one thread that writes. Bounded in bytes: when the
-// writer is too slow, new lines are refused, and the last part of the queue takes only errors.
-// New lines rather than old ones, because the first lines of a burst usually name its cause.
+// writer is too slow, new lines are refused, and the last part of the queue takes only errors. It
+// refuses new lines rather than dropping old ones, because the first lines of a burst usually name
+// its cause.
 // Threads: any may add; one takes. Owner: the log service.
 class LogQueue {
  public:

@@ -76,8 +76,8 @@ LogCategory& QueuedLogService::createCategory(std::string_view subsystem,
 }
 
 void QueuedLogService::stop() {
-  // In this order: the thread then writes what is queued, and a reader that does not read has a
-  // second for it.
+  // In this order, the thread writes what is queued, and waits one more second for a reader that
+  // does not read.
   queue_.end();
   sink_->finish();
   if (thread_.joinable()) thread_.join();
@@ -118,7 +118,7 @@ void QueuedLogService::reportLosses() {
                        .category = "log",
                        .text = std::move(text),
                        .wholeLength = length};
-  // Past the queue, which may be full again.
+  // Write directly to the sink: the queue may be full again.
   sink_->write({&entry, 1});
 }
 

@@ -31,10 +31,10 @@ namespace halvox::platform::linux_ {
 // service.
 class QueuedLogService final : public LogService {
  public:
-  // The least levels of lines that are written and of lines that are kept in memory. Without
-  // `kept`, none are kept.
+  // The lowest level of the lines that are written, and of those that are kept in memory. Without
+  // `kept`, no line is kept.
   struct Levels {
-    Levels(LogLevel toWrite) : written(toWrite) {}  // implicit: most name one
+    Levels(LogLevel toWrite) : written(toWrite) {}  // implicit: most callers name one level
     Levels(LogLevel toWrite, LogLevel toKeep) : written(toWrite), kept(toKeep) {}
     LogLevel written;
     std::optional<LogLevel> kept;

@@ -25,8 +25,8 @@ std::filesystem::path modulePath(const Module& module) {
   const auto program = std::filesystem::read_symlink("/proc/self/exe", error);
   const auto directory = program.parent_path();
   auto beside = directory / module.file;
-  // A build that is not installed has its modules beside the program. They win over installed ones,
-  // which may be of another build.
+  // A build that is not installed has its modules beside the program. They take precedence over
+  // installed ones, which may be of another build.
   if (std::filesystem::exists(beside, error)) return beside;
   // Relative to the program: an installation that was moved as a whole still finds its modules.
   return (directory / HALVOX_MODULES_FROM_PROGRAM / module.file).lexically_normal();
@@ -38,7 +38,7 @@ Result<void*> loadModule(const Module& module, const std::filesystem::path& path
   const auto failure = [&](const std::string& why) {
     return Failure<>{std::string(module.file) + ": " + why};
   };
-  // RTLD_NOW: a symbol that the program does not have is an error here, and not the end of the
+  // RTLD_NOW: a symbol that the program does not have is an error here. It would otherwise end the
   // process at the first call.
   void* const library = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
   if (library == nullptr) return failure(lastError());

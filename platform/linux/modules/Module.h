@@ -25,10 +25,10 @@ struct Module {
 // the process ends: its libraries have threads, and objects of the service refer to its code.
 // Blocks on the disk. Any thread may call.
 [[nodiscard]] Result<void*> loadModule(const Module& module);
-// The same for the module at that path.
+// Loads the module from that path, in the same way.
 [[nodiscard]] Result<void*> loadModule(const Module& module, const std::filesystem::path& path);
 
-// The same, for an entry point of that type.
+// Loads the module and returns its entry point as a function of that type.
 template <typename Function>
 [[nodiscard]] Result<Function*> loadEntryPoint(const Module& module) {
   Result<void*> loaded = loadModule(module);

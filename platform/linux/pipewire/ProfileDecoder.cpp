@@ -16,7 +16,7 @@ constexpr std::int32_t kCalled = 1;
 constexpr std::int32_t kAwake = 2;
 constexpr std::int32_t kFinished = 3;
 
-// No device works in longer cycles. A driver that claims a longer one is not a clock of audio.
+// No device works in longer cycles. A driver that reports a longer one is not an audio clock.
 constexpr std::chrono::duration<double> kLongestCycle{10};
 
 bool readClock(const spa_pod& value, ProfiledCycle& cycle) {
@@ -60,8 +60,8 @@ std::optional<ReadNode> readNode(const spa_pod& value) {
     return std::nullopt;
   }
   ReadNode read{.node = {.id = static_cast<std::uint32_t>(id)}, .stage = stage};
-  // A stage that was not reached has the time of an earlier cycle, or none, which is 0. That times
-  // are positive also keeps the differences from overflowing.
+  // A stage that was not reached has the time of an earlier cycle, or none, which is 0. Requiring
+  // positive times also keeps the differences from overflowing.
   if (signal > 0 && awake >= signal && stage >= kAwake) {
     read.node.wait = std::chrono::nanoseconds(awake - signal);
     if (finish >= awake && stage >= kFinished) {

@@ -31,7 +31,8 @@ bool ServerConnection::connect(pw_properties* properties) {
 
 void ServerConnection::disconnect() {
   if (core_ == nullptr) return;
-  // Each hook before the object that it is in, and the registry before the core that it came from.
+  // Remove each hook before the object that contains it, and the registry before the core that made
+  // it.
   spa_hook_remove(&registryHook_);
   registry_.reset();
   spa_hook_remove(&coreHook_);
@@ -42,7 +43,7 @@ void ServerConnection::requestAnswer() { request_ = pw_core_sync(core_.get(), PW
 
 void ServerConnection::onCoreInfo(void* data, const pw_core_info* info) {
   auto* self = static_cast<ServerConnection*>(data);
-  // The server sends it again when its properties change.
+  // The server sends this event again when its properties change.
   if (!std::exchange(self->isReached_, true)) self->listener_.onServerReached(*info);
 }
 

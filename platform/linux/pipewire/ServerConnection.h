@@ -44,8 +44,9 @@ class ServerListener {
 //
 //   disconnected --connect()--> connected --disconnect()--> disconnected
 //
-// A server that ends the connection does not change the state: the owner does so by disconnect(),
-// after it has destroyed its bindings to the server's objects. Belongs to the loop's thread.
+// When the server ends the connection, the state does not change until the owner calls
+// disconnect(), after it has destroyed its bindings to the server's objects. Belongs to the loop's
+// thread.
 class ServerConnection {
  public:
   // Neither is owned; both must outlive the connection.
@@ -62,9 +63,10 @@ class ServerConnection {
   void disconnect();
   [[nodiscard]] bool isConnected() const { return core_ != nullptr; }
 
-  // What objects are bound through. Only when connected.
+  // The registry through which objects are bound. Call only when connected.
   [[nodiscard]] pw_registry* registry() const { return registry_.get(); }
-  // Makes the server call onAnswered() after all that it has sent until then. Only when connected.
+  // Requests an answer, which calls onAnswered() after everything that the server has sent before
+  // it. Call only when connected.
   void requestAnswer();
 
  private:

@@ -26,15 +26,15 @@ class CounterStatisticsService final : public StatisticsService {
  public:
   Counter& counter(std::string_view piece, std::string_view name) override;
 
-  // All counters in the order of piece and name. Each is read by itself, so sums agree only after
-  // the threads that count have stopped.
+  // All counters in the order of piece and name. Each is read by itself: sums agree only after the
+  // threads that count have stopped.
   [[nodiscard]] std::vector<CounterReading> snapshot() const;
 
  private:
   using CountersOfPiece = std::map<std::string, Counter, std::less<>>;
 
   mutable Mutex mutex_;
-  // Elements of a map do not move, so references to counters stay valid.
+  // A map, because its elements do not move: references to counters stay valid.
   std::map<std::string, CountersOfPiece, std::less<>> counters_ HALVOX_GUARDED_BY(mutex_);
 };
 

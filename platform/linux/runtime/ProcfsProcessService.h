@@ -12,12 +12,12 @@ namespace halvox::platform::linux_ {
 // Processes as /proc shows them.
 //
 // A name comes from the kernel, which cuts it to 15 bytes, perhaps within a character; bytes that
-// are not UTF-8 become U+FFFD. A record that cannot be read, for whatever reason, counts as no
-// record. Any thread may call. The platform owns it.
+// are not UTF-8 become U+FFFD. A record that cannot be read, for whatever reason, counts as
+// missing. Any thread may call. The platform owns it.
 class ProcfsProcessService final : public ProcessService {
  public:
   // terminate() calls `beforeEnd`, which writes the log lines that are still queued. It must be
-  // quick: the process is to end at once.
+  // quick, because the process must end at once.
   explicit ProcfsProcessService(std::function<void()> beforeEnd = {})
       : beforeEnd_(std::move(beforeEnd)) {}
 

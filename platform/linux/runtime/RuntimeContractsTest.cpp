@@ -28,7 +28,7 @@ namespace adapters {
 class LibcClockHarness {
  public:
   ClockService& service() { return service_; }
-  // The clock under test is the real one, so only real time moves it.
+  // The clock under test is the real one: only real time moves it.
   void letPass(std::chrono::milliseconds time) { std::this_thread::sleep_for(time); }
 
  private:

@@ -13,7 +13,8 @@ namespace {
 constexpr std::uint32_t kLeaving = IN_MOVE_SELF | IN_DELETE_SELF;
 constexpr std::uint32_t kAppearing = IN_CREATE | IN_MOVED_TO;
 constexpr std::uint32_t kVanishing = IN_MOVED_FROM | IN_DELETE;
-// Close after writing instead of each write: a save is one change. IN_ATTRIB notices `touch`.
+// IN_CLOSE_WRITE and not IN_MODIFY: a save is one change, however many writes it makes. IN_ATTRIB
+// notices `touch`.
 constexpr std::uint32_t kChanging = IN_CLOSE_WRITE | IN_ATTRIB | kAppearing | kVanishing;
 // After one of these the watches may be incomplete, and all are made again.
 constexpr std::uint32_t kGone = kLeaving | IN_IGNORED | IN_UNMOUNT | IN_Q_OVERFLOW;
@@ -63,7 +64,8 @@ std::error_code DirectoryWatch::add(const std::filesystem::path& path, std::uint
 }
 
 // Watches every directory from the root to the wanted one. Watches the last one for changes of its
-// files, the others only for being moved or deleted. Where the path ends, waits for the next name.
+// files, the others only for being moved or deleted. Where the path ends, waits for the next
+// directory to appear.
 std::error_code DirectoryWatch::watchWay(std::size_t directory) {
   const std::filesystem::path& target = directories_[directory];
   std::filesystem::path path;
@@ -108,7 +110,8 @@ DirectoryWatch::State DirectoryWatch::read(const OnChange& onChange) {
       next += sizeof(inotify_event) + event->len;
       if ((event->mask & kGone) != 0) state = State::kMustBeArmedAgain;
       const auto watch = watches_.find(event->wd);
-      // Of a watch that was removed, or about the directory itself, which kGone covers.
+      // The event is of a watch that was removed, or about the directory itself, which kGone
+      // covers.
       if (watch == watches_.end() || event->len == 0) continue;
       const std::string_view file(event->name);
       if (watch->second.awaited.contains(file)) state = State::kMustBeArmedAgain;

@@ -16,7 +16,7 @@
 namespace halvox::platform::linux_ {
 
 // Watches the files in some directories with inotify. A directory need not exist: the watch then
-// waits until it appears. Uses no timer, so that an idle service makes no wake-ups.
+// waits until it appears. Uses no timer, so that an idle service causes no wake-ups.
 //
 //   made --arm()--> armed --(a directory appeared, disappeared or was moved; events were lost)-->
 //   must be armed again --arm()--> armed

@@ -26,7 +26,7 @@ using namespace std::chrono_literals;
 // first: steady changes must not delay a post for ever.
 constexpr auto kQuietTime = 50ms;
 constexpr auto kLongestDelay = 300ms;
-// Only while watching fails, so that it wakes nobody otherwise.
+// Used only while watching fails, so that it causes no wake-ups otherwise.
 constexpr auto kRetryTime = 5s;
 
 // The directories that are always watched, in order.
@@ -159,13 +159,13 @@ void InotifyNotifyService::arm() {
     log_.notice("watching the directories of the settings again");
   }
   logNotifyDirectory();
-  // Whatever changed while nothing was watched, or whose events were lost, is found by comparing
-  // everything once.
+  // Compare everything once, to find the changes that happened while nothing was watched and those
+  // whose events were lost.
   settings_.noteEverything();
   noteNews();
 }
 
-// Any change may have been one of a link. Watches the new targets if links now lead elsewhere.
+// Any change may have changed a link. Watches the new targets if links now lead elsewhere.
 void InotifyNotifyService::followLinks() {
   if (!settings_.hasNews()) return;
   if (settings_.linkedSettings() != linked_ ||
@@ -229,7 +229,7 @@ void InotifyNotifyService::deliver() {
   if (!firstNews_.has_value()) return;
   if (Clock::now() < std::min(lastNews_ + kQuietTime, *firstNews_ + kLongestDelay)) return;
   firstNews_.reset();
-  // A set: one save can change several domains of one name, and is one post.
+  // A set, because one save can change several domains of one name and must post it once.
   const std::set<std::string> posted = settings_.settle();
   for (const Registration& one : registrations_) {
     if (!posted.contains(one.name)) continue;

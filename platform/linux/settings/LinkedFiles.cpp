@@ -22,8 +22,8 @@ std::vector<fs::path> linkedFiles(const fs::path& path) {
     const fs::path part = rest.front();
     rest.pop_front();
     if (part.empty() || part == ".") continue;
-    // Relative to what the links before it led to, as the kernel does it. lexically_normal() would
-    // be wrong after a link.
+    // Resolve ".." from the target of the links before it, as the kernel does. lexically_normal()
+    // would be wrong after a link.
     if (part == "..") {
       way = way.parent_path();
       continue;

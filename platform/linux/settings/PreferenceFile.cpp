@@ -14,7 +14,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The parser quotes the file in its reasons, and anyone may write the file.
+// The parser quotes the file in its error messages, and anyone may have written the file.
 constexpr std::size_t kLongestReason = 400;
 
 Failure<> problem(const std::filesystem::path& file, std::string_view what) {
@@ -29,7 +29,7 @@ Failure<> problem(const std::filesystem::path& file, int error) {
   return problem(file, ": cannot read the preferences: " + errnoText(error));
 }
 
-// `size` may be less than the limit: the file grew after that was found.
+// `size` may be less than the limit if the file grew after its size was read.
 Failure<> tooLarge(const std::filesystem::path& file, std::uint64_t size) {
   return problem(file,
                  ": expected at most " + std::to_string(kLargestPreferenceFile) + " bytes, found " +

@@ -12,7 +12,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// With more entries, all are forgotten, and a mistake may be logged a second time.
+// When there are more entries, all are removed, and a mistake may be logged a second time.
 constexpr std::size_t kMostLogged = 64;
 
 // Identifies the state of a file, so that a file saved again with the same mistake is logged again.

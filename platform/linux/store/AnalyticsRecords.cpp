@@ -52,7 +52,7 @@ void AnalyticsRecords::takeQueued() {
 }
 
 SqliteCode AnalyticsRecords::prepare(Database& database) {
-  // Another database may have come in the place of the last, with other numbers for the names.
+  // The database may be another one than before, with other numbers for the names.
   ++generation_;
   const SqliteCode code = spans().prepare(database);
   if (code != SQLITE_OK) return code;

@@ -30,8 +30,8 @@ constexpr double kEnd = 253402300800.0;       // 10000-01-01
 
 enum class TextKind : std::uint8_t { kPlain, kEscapesNeeded, kNotAscii };
 
-// Tests eight bytes at a time: nearly all texts are plain, and are then copied without a second
-// look.
+// Tests eight bytes at a time: nearly all texts are plain, and are then copied without further
+// tests.
 TextKind classify(std::string_view text) {
   constexpr std::uint64_t kOnes = 0x0101010101010101U;
   constexpr std::uint64_t kHighs = kOnes * 0x80U;

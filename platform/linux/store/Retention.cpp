@@ -12,7 +12,8 @@ namespace {
 constexpr std::chrono::minutes kAgeInterval{1};
 // The most steps in one transaction, so that waiting records are not held up for long. A step by
 // age covers a span of 512 records of each kind. A step by size deletes 64 records: 128 steps
-// delete 8,192, twice what one transaction can add, so retention keeps up with any writing.
+// delete 8,192, twice what one transaction can add. Retention therefore keeps up with any rate of
+// writing.
 constexpr int kAgeSteps = 16;
 constexpr int kSizeSteps = 128;
 constexpr std::uint64_t kLeastPage = 512;  // SQLite's smallest page
@@ -57,7 +58,7 @@ SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
 }  // namespace
 
 SqliteCode Retention::prepare(Database& database) {
-  // Asked from SQLite: a database that another program made may have pages of another size.
+  // Read the size from SQLite: a database that another program made may have pages of another size.
   pageBytes_ = static_cast<std::uint64_t>(database.queryInteger("PRAGMA page_size").value_or(0));
   // Vacuum writes each page that it moves to the log. Move so few at a time that the log does not
   // outgrow its limit.
@@ -85,7 +86,7 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
   const bool byAge = std::chrono::steady_clock::now() >= nextByAge_;
   SqliteCode code = readUse();
   if (code != SQLITE_OK) return code;
-  // The usual case. This runs after every transaction, so it must not begin one of its own.
+  // The usual case. It must not begin a transaction, because this runs after every transaction.
   if (!byAge && !isFull() && fileBytes() <= limits_.databaseBytes) return SQLITE_OK;
 
   const std::uint64_t before = fileBytes();

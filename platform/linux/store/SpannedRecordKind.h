@@ -52,7 +52,7 @@ class SpannedRecordKind : public RecordKind {
   // closed; then the record is counted as dropped.
   template <typename Append>
   bool addQueued(Append&& append) {
-    // Before the wait for room, so that the counts show what waits.
+    // Count before waiting for room, so that the counts include callers that wait.
     counters_.addReceived();
     const bool added = queue_.add(std::forward<Append>(append));
     if (!added) counters_.addDropped(DropReason::kClosed, 1);

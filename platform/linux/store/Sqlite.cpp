@@ -27,7 +27,8 @@ std::string_view Statement::bytes(int column) const {
 
 SqliteCode Database::open(const std::string& file, DatabaseAccess access) {
   // Without SQLITE_OPEN_CREATE: StoreFiles creates the file, with the mode that it must have.
-  // NOMUTEX: each connection belongs to one thread at a time, so SQLite's own lock is not needed.
+  // NOMUTEX: SQLite's own lock is not needed, because each connection belongs to one thread at a
+  // time.
   const int mode =
       access == DatabaseAccess::kReadOnly ? SQLITE_OPEN_READONLY : SQLITE_OPEN_READWRITE;
   const SqliteCode code = sqlite3_open_v2(file.c_str(), handle_.out(),

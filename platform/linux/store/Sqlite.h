@@ -72,7 +72,7 @@ enum class DatabaseAccess : std::uint8_t { kReadWrite, kReadOnly };
 class Database {
  public:
   // Opens an existing file, named by a path or a "file:" URI, and never creates one. SQLite does
-  // not read the file before the first statement, so a damaged file is noticed only then.
+  // not read the file before the first statement: a damaged file is noticed only then.
   [[nodiscard]] SqliteCode open(const std::string& file, DatabaseAccess access);
   // Closes the connection. All its statements must have been destroyed before.
   void close() { handle_.reset(); }

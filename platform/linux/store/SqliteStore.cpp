@@ -136,9 +136,9 @@ bool SqliteStore::logHasRoom() {
 }
 
 Result<void, StoreError> SqliteStore::openDatabase() {
-  // An orderly close removes the log. One that exists was left by a run that was killed, or that
-  // ended before it had checked the database.
-  // Before the database is opened, which makes a log.
+  // An orderly close removes the log. A log that exists was left by a run that was killed, or that
+  // ended before it had checked the database. Look for it before opening the database, which makes
+  // a new log.
   bool mustCheck = files_.logBytes() > 0;
   if (auto opened = openStoreDatabase(files_, sizes_, database_); !opened) return opened;
   SqliteCode code = useDatabase();
@@ -288,7 +288,7 @@ void SqliteStore::closeDatabase() {
   if (!database_.isOpen()) return;
   // sqlite3_close() also copies the log, but only when no other connection is open.
   sqlite3_wal_checkpoint_v2(database_.get(), nullptr, SQLITE_CHECKPOINT_PASSIVE, nullptr, nullptr);
-  // By the log that stays the next run sees that it has to check.
+  // Keep the log: it shows the next run that it must check the database.
   if (!isChecked) return abandon(database_);
   database_.close();
 }

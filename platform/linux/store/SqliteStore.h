@@ -41,7 +41,7 @@ struct StoreOptions {
 //
 // Any thread adds records to the kinds below. One thread writes: SQLite allows one writer at a
 // time, and each commit has a fixed cost that a batch shares. The writer commits everything that
-// has come since its last commit, and starts at once when it was idle. A record is in the database
+// has arrived since its last commit, and starts at once if it was idle. A record is in the database
 // within half a second after the call that added it, unless the store dropped it; killing the
 // process later cannot lose it. A power cut can lose what the last checkpoint of the log had not
 // synced.

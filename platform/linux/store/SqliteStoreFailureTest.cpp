@@ -68,7 +68,7 @@ TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileTheDiskIsFullThenStoresA
   EXPECT_THAT(rows(database(), "PRAGMA integrity_check"), ElementsAre("ok"));
 }
 
-// Records of all kinds share transactions, so one full disk fails them together. Each kind must
+// Records of all kinds share transactions, and a full disk fails them together. Each kind must
 // count its own losses.
 TEST_F(SqliteStoreFailureTest, RecordsOfEveryKindAreCountedWhileTheDiskIsFullAndStoredAgainLater) {
   start();

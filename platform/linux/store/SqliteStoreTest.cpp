@@ -129,7 +129,7 @@ TEST_F(SqliteStoreTest, AnEventIsInTheDatabaseWithinHalfASecondWhileTheStoreRuns
     delays.push_back(std::chrono::steady_clock::now() - sent);
   }
 
-  // A store that gathers for too long delays all of them, a busy machine only some.
+  // A store that gathers for too long delays all records; a busy machine delays only some.
   std::ranges::sort(delays);
   EXPECT_LT(delays[delays.size() / 2], std::chrono::milliseconds(500));
 }

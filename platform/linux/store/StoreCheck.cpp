@@ -127,8 +127,8 @@ void StoreCheck::run(const std::string& file, const StoreExtent& extent, const O
 
 StoreCheck::Outcome StoreCheck::readAll(Database& database, const StoreExtent& extent,
                                         std::string& what) {
-  // The table of names is the only one with an index, and reading rows does not read an index. The
-  // names are few, so one slice is enough.
+  // The table of names is the only one with an index, and reading rows does not read an index. One
+  // slice is enough, because there are few names.
   Statement names;
   SqliteCode code = database.prepare("PRAGMA quick_check(event_names)", names);
   if (code == SQLITE_OK) code = names.step();

@@ -19,9 +19,10 @@ namespace halvox::platform::linux_ {
 //                        +--stop()--> stopped
 //
 // A killed service leaves its database sound. A failing disk, a power cut or another program may
-// damage it. Reading a large database takes minutes on a cold disk, so a thread of its own with low
-// priority reads it in slices. Each slice ends its transaction, because an open one would keep the
-// writer from reusing the write-ahead log. After each slice the thread pauses for the same time.
+// damage it. Reading a large database takes minutes on a cold disk. A thread of its own, with low
+// priority, therefore reads it in slices. Each slice ends its transaction, because an open one
+// would keep the writer from reusing the write-ahead log. After each slice the thread pauses for
+// the same time.
 //
 // Reads only the records that existed when the database was opened: this run has written the later
 // ones. Reports only damage. If the file cannot be read for another reason, logs an error and gives

@@ -45,7 +45,8 @@ class StoreCheckTest : public StoreFixture {
     content.replace(content.size() / 2, 20'000, std::string(20'000, '\xA5'));
     writeFile(database(), content);
   }
-  // The check has a low priority, so these wait for a long time on a busy machine.
+  // These functions wait for a long time, because the check has a low priority and is slow on a
+  // busy machine.
   bool eventuallySetAside() {
     return patiently([this] { return !setAsideFiles().empty(); });
   }

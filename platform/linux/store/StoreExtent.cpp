@@ -85,7 +85,7 @@ std::uint64_t copyRecordsAfter(const StoreExtent& extent, const std::string& fil
       note(tables.records);
       continue;
     }
-    // The new database held no records, so all that are in it are copies.
+    // All records in the new database are copies, because it was empty.
     const auto count =
         database.queryInteger("SELECT count(*) FROM main." + std::string(tables.records));
     copied += static_cast<std::uint64_t>(count.value_or(0));

@@ -24,9 +24,9 @@ inline constexpr std::array<KindTables, 5> kKindTables{{
     {"snapshot_records", "snapshot_spans"},
 }};
 
-// The number of the newest record of each kind, in the order of kKindTables; 0 if there is none.
-// A store takes it when it opens its database. Record numbers only grow, so it separates the
-// records of earlier runs from those of this run. A plain value.
+// The number of the newest record of each kind, in the order of kKindTables; 0 if there is none. A
+// store takes it when it opens its database. It separates the records of earlier runs from those of
+// this run, because record numbers only grow. A plain value.
 struct StoreExtent {
   std::array<std::int64_t, kKindTables.size()> newest{};
 

@@ -58,8 +58,7 @@ Result<void, StoreError> examine(const StoreFiles& files, Database& database) {
   if (code != SQLITE_OK) return judged(code, files, database);
   // Before the first statement: another program may hold a lock while the service starts.
   sqlite3_busy_timeout(database.get(), static_cast<int>(kBusyTimeout.count()));
-  // Reads the first page. A file that is not a database is found out here, before anything changes
-  // it.
+  // Reads the first page. This detects a file that is not a database before anything changes it.
   code = database.execute("PRAGMA schema_version");
   if (code != SQLITE_OK) return judged(code, files, database);
   const auto version = database.queryInteger("PRAGMA user_version");

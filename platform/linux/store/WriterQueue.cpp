@@ -38,7 +38,7 @@ void WriterQueue::requestRound() {
 
 bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
   const MutexLock lock(mutex_);
-  // Sleeps without a time limit: an idle service makes no wake-ups.
+  // Sleeps without a time limit: an idle service causes no wake-ups.
   while (queued_ == 0 && !closed_ && !roundRequested_) {
     writer_ = Writer::kIdle;
     work_.wait(mutex_);
@@ -66,7 +66,7 @@ void WriterQueue::finish(std::uint64_t records, std::uint64_t bytes) {
     waiting_ -= records;
     estimate(records, bytes);
     wakeCallers = callersWaiting_ > 0;
-    // A gap to the soft limit, so that connections are not stopped and started by turns.
+    // Well below the soft limit, so that connections do not stop and start again and again.
     relieve = backpressure_.isHigh() && waiting_ <= softRecords_ / 4;
   }
   if (wakeCallers) room_.notifyAll();
@@ -113,7 +113,7 @@ void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {
   // The estimates rise at once and fall by at most a quarter a batch. Too high a limit breaks the
   // promised half second; too low a limit only slows callers for a moment.
   bytesPerRecord_ = std::max(bytes / records, bytesPerRecord_ - bytesPerRecord_ / 4);
-  // A small batch counts after all when it took as long as a full queue may.
+  // A small batch also counts if it took as long as a full queue may take.
   if (records >= kTellingRecords || elapsed >= limits_.softTime) {
     timePerRecord_ =
         std::max(elapsed / static_cast<std::int64_t>(records), timePerRecord_ - timePerRecord_ / 4);

@@ -9,8 +9,8 @@
 
 namespace halvox::platform::linux_ {
 
-// How many records may wait. The writer builds payloads when it writes them, so the size of a
-// waiting record and the time that it will take are not known yet. The queue estimates both from
+// How many records may wait. The size of a waiting record and the time that it will take are not
+// known yet, because the writer builds payloads when it writes them. The queue estimates both from
 // the records written last, and applies whichever of the three soft limits is reached first.
 //
 // At the soft limit connections are read more slowly; at the hard limit callers wait. With these
@@ -41,9 +41,10 @@ class WriterQueue {
   using Time = std::chrono::steady_clock::time_point;
   using Clock = std::function<Time()>;
 
-  // Raises `backpressure` at the soft limit and relieves it below a quarter of it, so that it does
-  // not flutter. Does not own it; it must outlive the queue. `clock` measures how long writing
-  // takes; the writer calls it, under the lock. What take() waits for is real time.
+  // Raises `backpressure` at the soft limit and relieves it at a quarter of that limit, so that it
+  // does not switch back and forth. Does not own `backpressure`, which must outlive the queue.
+  // `clock` measures how long writing takes; the writer calls it, under the lock. The waits of
+  // take() are in real time.
   WriterQueue(const QueueLimits& limits, Backpressure& backpressure,
               Clock clock = std::chrono::steady_clock::now);
 

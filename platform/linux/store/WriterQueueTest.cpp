@@ -102,7 +102,7 @@ TEST(WriterQueueTest, HoldsFewerRecordsWhenWritingIsSlow) {
   now += kSmall.softTime;  // the slow writing
   queue.finish(4, 0);
 
-  // Four records took longer than the soft time, so four waiting records are too many.
+  // Four waiting records are too many, because four records took longer than the soft time.
   addMany(queue, 4);
   EXPECT_TRUE(backpressure.isHigh());
 }

@@ -10,7 +10,7 @@ namespace halvox::platform::linux_ {
 inline constexpr std::chrono::seconds kTestDeadline{30};
 
 // Returns true when the condition holds, and false when it does not hold within kTestDeadline.
-// Between two looks it calls `turn`; without one, it sleeps for a millisecond.
+// Between two checks it calls `turn`; without one, it sleeps for a millisecond.
 //
 // It is for conditions that nothing signals: the state of the kernel, of another process, or of a
 // library. A test waits for a future, a condition variable or a descriptor itself if there is one.
@@ -20,10 +20,10 @@ inline constexpr std::chrono::seconds kTestDeadline{30};
                               const std::function<void()>& turn = {});
 
 // Returns true when `count` settles and then keeps its value for `time`. It has settled when two
-// looks a tenth of a second apart see the same value; if it never settles, the result is false.
+// readings a tenth of a second apart are equal; if it never settles, the result is false.
 //
 // It is for what must not happen, such as a wake-up of an idle thread. Nothing signals that it does
-// not happen, therefore this and a real clock are all that a test may let real time pass for.
+// not happen. A test may let real time pass only for this purpose and to test a real clock.
 [[nodiscard]] bool staysQuiet(const std::function<long()>& count, std::chrono::milliseconds time);
 
 }  // namespace halvox::platform::linux_

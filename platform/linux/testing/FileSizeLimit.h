@@ -6,8 +6,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Lets files of this process grow to so many bytes and no further, as a full disk would, as long as
-// it lives. One at a time.
+// While it exists, files of this process cannot grow beyond that many bytes, as on a full disk. One
+// at a time.
 class FileSizeLimit {
  public:
   explicit FileSizeLimit(rlim_t bytes) : oldAction_(std::signal(SIGXFSZ, SIG_IGN)) {

@@ -10,7 +10,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Keeps the lines; can be held up like a reader that does not read.
+// Keeps the lines. A test can make it block, like a reader that does not read.
 class MemoryLogSink final : public LogSink {
  public:
   std::size_t write(std::span<const LogEntry> entries) override {

@@ -6,7 +6,8 @@
 
 namespace halvox::platform::linux_ {
 
-// While it lives, new threads are to have stacks larger than any address space, so there are none.
+// While it exists, no thread can be started: the default size of stacks is larger than any address
+// space.
 class NoThreadsToHave {
  public:
   NoThreadsToHave() {

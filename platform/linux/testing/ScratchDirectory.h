@@ -6,8 +6,8 @@
 
 namespace halvox::platform::linux_ {
 
-// An empty directory of a test's own. The destructor removes it with its content.
-// Its path is short enough for sockets in it. The constructor throws when it cannot make one.
+// An empty directory for one test. The destructor removes it with its content. Its path is short
+// enough for sockets in it. The constructor throws when it cannot make one.
 class ScratchDirectory {
  public:
   ScratchDirectory();

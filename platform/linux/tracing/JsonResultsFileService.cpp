@@ -84,7 +84,7 @@ class ResultsFile final : public Sswriter {
       writeText(json, name);
       json.StartArray();
       for (const double value : values) {
-        // JSON has no NaN and no infinities. The place of the value in its list is kept.
+        // JSON has no NaN and no infinities. null keeps the value's place in its list.
         std::isfinite(value) ? json.Double(value) : json.Null();
       }
       json.EndArray();

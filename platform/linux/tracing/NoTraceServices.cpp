@@ -27,8 +27,8 @@ std::shared_ptr<NoSession> own(const KtraceService::Session& session, State stat
   return ours != nullptr && ours->state == state ? ours : nullptr;
 }
 
-// Kernel traces that cannot be started. They follow the states of the port all the same: an end
-// completes them, because the session's stop waits for the completion.
+// Kernel traces that cannot be started. They still follow the states of the port: an end completes
+// them, because the session's stop waits for the completion.
 class NoKtraceService final : public KtraceService {
  public:
   Session ktrace_session_create() override { return std::make_shared<NoSession>(); }
@@ -44,8 +44,8 @@ class NoKtraceService final : public KtraceService {
   int ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) override {
     const auto ours = own(session, State::kMade);
     if (ours == nullptr || queue == nullptr) return kNoTracer;
-    // Although this returns an error: the caller ends what it has started, and waits for the
-    // completion.
+    // The trace counts as started although this returns an error: the caller ends it and waits for
+    // the completion.
     ours->state = State::kStarted;
     ours->queue = std::move(queue);
     return kNoTracer;

@@ -150,7 +150,7 @@ std::optional<Data> PlistPropertyListService::readFile(std::string_view path,
     error = fileError("read", name, systemError);
     return std::nullopt;
   };
-  // The system would open the file whose name ends there.
+  // The system would end the name at the NUL and open another file.
   if (name.find('\0') != std::string::npos) return fail(EINVAL);
   const FileContent content = readWholeFile({.path = name.c_str(), .most = kMostFileBytes});
   switch (content.outcome) {

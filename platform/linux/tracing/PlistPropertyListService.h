@@ -6,10 +6,10 @@ namespace halvox::platform::linux_ {
 
 // Reads property lists in XML and binary form with libplist; the content decides which form it is.
 //
-// Clients name the files, so everything is bounded before the library sees it. Only regular files
-// of at most 16 MiB are read, without waiting for another process such as the writer of a pipe.
-// More than 64 levels, 500,000 values or 32 MiB of text are errors, also if a binary list reaches
-// them by using one value many times.
+// Everything is bounded before the library sees it, because clients name the files. Only regular
+// files of at most 16 MiB are read, without waiting for another process such as the writer of a
+// pipe. More than 64 levels, 500,000 values or 32 MiB of text are errors, also if a binary list
+// reaches them by using one value many times.
 //
 // Any thread may call; reading waits for the disk. The composition root owns the service.
 class PlistPropertyListService final : public PropertyListService {

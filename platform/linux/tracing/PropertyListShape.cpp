@@ -36,7 +36,7 @@ bool hasNulInXml(std::string_view text) {
 //
 // This is not an XML parser, and must not be: it only has to count at least as much as the library
 // will. Whatever the library might read differently is refused or counted against the file. Opening
-// tags count in comments too, closing ones do not; quotes in tags must be balanced and contain no
+// tags inside comments count, closing ones do not; quotes in tags must be balanced and contain no
 // bracket; the document type must not have declarations of its own.
 class XmlShape {
  public:
@@ -150,8 +150,8 @@ class BinaryShape {
     Object content{};
   };
 
-  // The last 32 bytes describe the rest. Every number in them is from outside, so each is compared
-  // with the size of the file before it is used; the subtraction and the division cannot overflow.
+  // The last 32 bytes describe the rest. Every number in them is from outside and is compared with
+  // the size of the file before it is used. The subtraction and the division cannot overflow.
   Reason readTrailer() {
     constexpr std::size_t kHeader = 8;
     constexpr std::size_t kTrailer = 32;
@@ -205,7 +205,7 @@ class BinaryShape {
 
   Reason take(Weight& parent, const Weight& child) const {
     parent.depth = static_cast<std::uint8_t>(std::max<int>(parent.depth, child.depth + 1));
-    // With each use of a shared object: the library makes a copy for each.
+    // Add them for each use of a shared object, because the library makes a copy for each use.
     parent.elements += child.elements;
     parent.bytes += child.bytes;
     if (parent.depth > bounds_.depth) return kTooDeep;

@@ -19,8 +19,8 @@ struct PropertyListBounds {
 // not be a property list: the library finds that out.
 //
 // The check comes first because the library cannot be stopped. It recurses for each level until the
-// stack ends, copies each value that a binary list uses twice, so a few bytes can become any number
-// of values, and ends the process by an assertion at a key with a NUL.
+// stack ends. It copies each value that a binary list uses twice, which can make any number of
+// values from a few bytes. It ends the process by an assertion at a key with a NUL.
 //
 // Allocates a few bytes for each object of a binary list. Any thread may call.
 [[nodiscard]] std::optional<std::string> whyUnreadable(std::string_view bytes,

@@ -29,13 +29,13 @@ class TraceServices {
   // Removes what an earlier service with the same storage directory did not remove. Waits for the
   // tracer only if there is anything.
   virtual void open() = 0;
-  // Lets running traces end soon: from now on nothing waits for a queue. Call it before the queues
-  // end.
+  // Lets running traces end soon: after this call, nothing waits for a queue. Call it before the
+  // queues end.
   virtual void stop() = 0;
   // Removes everything that this service made in the tracer. Call it after the queues have ended.
   virtual void close() = 0;
-  // The same if a queue does not end, such as that of a stop that waits for its trace. May wait for
-  // an operation of the tracer that is in progress.
+  // Replaces close() if a queue does not end, for example because a stop waits for its trace. May
+  // wait for an operation of the tracer that is in progress.
   virtual void abandon() = 0;
   // Names the tracer in log lines.
   [[nodiscard]] virtual std::string description() const = 0;

@@ -17,7 +17,7 @@ void CallbackThread::call(Callback callback) {
       return;
     }
   }
-  // The system has no thread to give. The callback must still not run on the caller's thread.
+  // The system cannot start a thread. The callback must still not run on the caller's thread.
   dispatch_.asyncAfterOnBackgroundQueue(std::chrono::nanoseconds(0), std::move(callback));
 }
 
@@ -34,7 +34,7 @@ void CallbackThread::stop() {
 
 // Returns false if the system cannot start a thread.
 bool CallbackThread::provideThread() {
-  // A thread from before has released the lock for the last time, so join() does not wait for it.
+  // An earlier thread has released the lock for the last time: join() returns at once.
   if (thread_.joinable()) thread_.join();
   try {
     thread_ = std::thread(&CallbackThread::run, this);

@@ -13,7 +13,7 @@
 namespace halvox::platform::linux_ {
 
 // The common part of the real-time reporting frameworks that have no servers. Each message is
-// accepted or refused during the call, therefore a flush completes at once. Every discovery finds
+// accepted or refused during the call. A flush therefore completes at once. Every discovery finds
 // the same back-ends.
 // Threads: any may call. Owner: the platform, which also owns the callback thread; it must outlive
 // this object.

@@ -7,13 +7,14 @@
 
 namespace halvox::platform::linux_ {
 
-// Limits the log lines of a burst of failures: the first failure gets a line, then at most one line
-// a second that stands for all failures since the line before. Not thread-safe: the owner locks.
+// Limits the log lines of a burst of failures: the first failure gets a line; after it, at most one
+// line a second covers all failures since the previous line. Not thread-safe: the owner locks.
 class BurstLog {
  public:
   using Time = std::chrono::steady_clock::time_point;
 
-  // Adds failures. Returns how many the caller shall log now; std::nullopt if it shall log nothing.
+  // Adds failures. Returns how many failures the caller must log now; std::nullopt if it must not
+  // log.
   [[nodiscard]] std::optional<std::uint64_t> note(std::uint64_t failures, Time now) {
     unlogged_ += failures;
     if (last_ && now - *last_ < kPause) return std::nullopt;

@@ -11,7 +11,8 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
-// For the threads of the library, which have no work left. More means that one of them hangs.
+// How long to wait for the threads of the library, which have no work left. If they need longer,
+// one of them hangs.
 constexpr std::chrono::milliseconds kLibraryEndTime{2000};
 constexpr std::int64_t kDefaultSpin = -1;  // how long the library spins on its locks
 }  // namespace
@@ -56,7 +57,7 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
     return dispatch_.asyncAfterOnBackgroundQueue(
         std::chrono::nanoseconds(0), [found = std::move(found)] { found(std::nullopt); });
   }
-  // An attempt cannot be cancelled, so its callers are answered without waiting for its end.
+  // Answer the callers without waiting for the end of the attempt, which cannot be cancelled.
   dispatch_.asyncAfterOnBackgroundQueue(kDiscoveryTime, [link = weak_from_this(), waiter] {
     if (const auto self = link.lock()) self->expire(waiter);
   });
@@ -81,8 +82,8 @@ std::optional<Error> NatsLink::refusal(std::size_t bytes) {
     return refusedByLink("the message has " + std::to_string(bytes) +
                          " bytes; the NATS server accepts at most " + std::to_string(maxPayload_));
   }
-  // The attempt that just failed answers for this message, too: the sender learns at once that
-  // messages are lost instead of after another time-out.
+  // The attempt that just failed decides about this message, too: the sender gets the error at
+  // once, not after another time-out.
   if (state_ == State::kIdle && !lastFailure_.empty() &&
       std::chrono::steady_clock::now() < nextAttempt_) {
     return refusedByLink("cannot connect to a NATS server: " + lastFailure_);
@@ -122,7 +123,7 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
 bool NatsLink::close() {
   {
     const MutexLock lock(mutex_);
-    // Called again. A thread that still hung at the end of the first call is joinable.
+    // This is not the first call. The thread is still joinable if it hung at the end of the first.
     if (closeBy_) return !thread_.joinable();
     const Time now = std::chrono::steady_clock::now();
     closeBy_ = now + kCloseTime;
@@ -191,7 +192,7 @@ std::string NatsLink::provideThread() {
 }
 
 void NatsLink::wakeThread() {
-  // Only for a thread that waits. One at work looks for the next step by itself.
+  // Wake the thread only if it waits. A working thread finds the next step by itself.
   if (!std::exchange(isIdle_, false)) return;
   changed_.notifyAll();
 }
@@ -203,18 +204,18 @@ bool NatsLink::hasConnection() const {
 // Whether somebody needs a connection.
 bool NatsLink::isNeeded() { return !waiters_.empty() || publisher_.hasQueued(); }
 
-// After close(): whether nothing is left to do, or no time to do it.
+// After close(): whether no work or no time remains.
 bool NatsLink::isAtEnd(Time now) {
   if (!closeBy_) return false;
   return !hasConnection() || state_ == State::kLost || publisher_.isDone() || now >= *closeBy_;
 }
 
 NatsLink::Step NatsLink::nextStep(Time now) {
-  // The end before all other steps: close() waits for it with a limit.
+  // Check for the end before all other steps: close() waits for it only for a limited time.
   if (isAtEnd(now)) return Step::kEnd;
   if (!answers_.empty()) return Step::kCallBack;
   if (state_ == State::kLost) return Step::kDrop;
-  // Before connecting, which can take seconds: a flush waits for the messages that are overdue.
+  // Abandon overdue messages before connecting, which can take seconds: a flush waits for them.
   if (const auto deadline = publisher_.firstDeadline(); deadline && now >= *deadline) {
     return Step::kAbandon;
   }

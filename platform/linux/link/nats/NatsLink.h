@@ -30,7 +30,7 @@ namespace halvox::platform::linux_ {
 //
 // There is at most one attempt to connect at a time; all callers of discover() wait for it, at most
 // kDiscoveryTime. After a failed attempt, the next one begins on demand, and not before
-// kAttemptPause has passed: an idle service without servers makes no wake-ups.
+// kAttemptPause has passed: an idle service without servers causes no wake-ups.
 //
 // An attempt of the library cannot be cancelled: it holds the lock of its connection object. It can
 // take for ever, because the library sets no time limit for a TLS handshake. close() therefore

@@ -67,7 +67,7 @@ natsStatus secure(natsOptions* options, const Configuration::Link& link) {
   if (status == NATS_OK && !tls.certificate.empty()) {
     status = natsOptions_LoadCertificatesChain(options, tls.certificate.c_str(), tls.key.c_str());
   }
-  // Only where the configuration says so. The library checks certificates and names by default.
+  // Only if the configuration says so. The library checks certificates and names by default.
   if (status == NATS_OK && !tls.verify) {
     status = natsOptions_SkipServerVerification(options, true);
   }
@@ -90,8 +90,8 @@ natsStatus NatsLink::configure(natsOptions* options) {
   const auto closed = [](natsConnection* connection, void* link) {
     static_cast<NatsLink*>(link)->onClosed(connection);
   };
-  // The default handler prints to stderr. What matters of these errors shows in the
-  // acknowledgements.
+  // The default handler prints to stderr. The acknowledgements already show the effects of these
+  // errors.
   const auto ignore = [](natsConnection*, natsSubscription*, natsStatus, void*) {};
   for (const natsStatus status :
        {natsOptions_SetServers(options, urls.data(), static_cast<int>(urls.size())),
@@ -153,7 +153,8 @@ void NatsLink::connect() {
   natsConnection* const opened = connection.get();
   {
     const MutexLock lock(mutex_);
-    // Callbacks were ignored until here, because connection_ was another.
+    // Until here, callbacks for this connection were ignored, because connection_ was not yet set
+    // to it.
     endAttempt(natsConnection_IsClosed(opened) ? State::kLost : State::kAway);
     connection_ = std::move(connection);
     context_ = std::move(context);
@@ -164,7 +165,7 @@ void NatsLink::connect() {
   onAvailable(opened);
 }
 
-// What waits for a server fails with the attempt: to keep it would only delay the error.
+// Everything that waits for a server fails with the attempt: keeping it would only delay the error.
 void NatsLink::failAttempt(const std::string& failure) {
   std::optional<std::uint64_t> worthALine;
   {
@@ -244,7 +245,8 @@ void NatsLink::onAway(natsConnection* connection) {
     const MutexLock lock(mutex_);
     if (connection != connection_.get()) return;
     if (state_ == State::kConnected) state_ = State::kAway;
-    // Before the library reconnects: what is published then would overtake what was on its way.
+    // Hold before the library reconnects: a message that is published then would overtake those
+    // that were on their way.
     publisher_.holdAfterLoss();
     changed_.notifyAll();
   }

@@ -99,7 +99,8 @@ void NatsPublisher::detach() {
   std::vector<PendingAcks::Entry> lost;
   {
     const MutexLock lock(mutex_);
-    // Window and flow describe a connection. The next one begins with neither.
+    // The state of the window and of the flow belongs to one connection. Reset both for the next
+    // one.
     isWindowFull_ = false;
     flow_ = Flow::kFlowing;
     isStreamInDoubt_ = false;
@@ -148,16 +149,17 @@ NatsPublisher::Step NatsPublisher::nextStep(Time now) {
   // Half a window at a time: to wake the thread for every acknowledgement costs more than the
   // acknowledgement itself.
   if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
-  // Nothing is left whose order a probe could keep.
+  // No message remains whose order a probe could keep.
   if (pending_.size() == 0) flow_ = Flow::kFlowing;
   if (flow_ == Flow::kProbing) return Step::kWait;
   if (flow_ == Flow::kHolding) return now >= probeAt_ ? Step::kProbe : Step::kWait;
-  // Before the queue: messages that were published before must not be overtaken.
+  // Check these before the queue: new messages must not overtake messages that were published
+  // before.
   if (pending_.needsAgain()) return pending_.hasAgain() ? Step::kSend : Step::kWait;
   return !queue_.empty() && !isWindowFull_ ? Step::kSend : Step::kWait;
 }
 
-// Decides anew: an acknowledgement may have come since canPublish().
+// Decides again: an acknowledgement may have arrived since canPublish().
 void NatsPublisher::publishNext() {
   Step step = Step::kWait;
   {
@@ -207,7 +209,7 @@ void NatsPublisher::publishSome() {
 }
 
 void NatsPublisher::probe() {
-  // First the stream: without it, this probe fails like the last one.
+  // Look for the stream first: without it, this probe fails like the last one.
   provideStreamAgain();
   reclaim();
   std::vector<NatsMessage> messages;
@@ -225,8 +227,8 @@ void NatsPublisher::probe() {
   publish(std::move(messages), kProbeTime);
 }
 
-// Looks for the stream, which may be deleted rather than without a leader: both look the same to a
-// publisher. Not with every probe, see kStreamCheckPause.
+// Looks for the stream. It may have been deleted, or it may only have no leader: a publisher cannot
+// distinguish the two. Does not look with every probe; see kStreamCheckPause.
 void NatsPublisher::provideStreamAgain() {
   const Time now = std::chrono::steady_clock::now();
   {
@@ -241,8 +243,8 @@ void NatsPublisher::provideStreamAgain() {
   kLog.error("NATS accepts no messages: ", provision.failure, "; messages wait");
 }
 
-// Takes back from the library the messages that it still awaits acknowledgements for, to publish
-// them again in order. It would otherwise time out each of them by itself.
+// Takes back from the library the messages whose acknowledgements it still awaits, to publish them
+// again in order. The library would otherwise time out each of them by itself.
 void NatsPublisher::reclaim() {
   natsMsgList list{};
   if (js_PublishAsyncGetPendingList(&list, context_) != NATS_OK) return;
@@ -338,7 +340,7 @@ void NatsPublisher::resolve(NatsMessage message, const jsPubAckErr* error) {
     message.reset();
     const bool isProbed = flow_ == Flow::kProbing;
     if (isProbed) flow_ = Flow::kFlowing;
-    // Most acknowledgements need not wake the thread. After these it has something to do.
+    // Most acknowledgements need not wake the thread. These give it something to do.
     isAwaited = isProbed || pending_.needsAgain() || (isWindowFull_ && pending_.isHalfFree()) ||
                 (isEnding_ && pending_.size() == 0);
   }

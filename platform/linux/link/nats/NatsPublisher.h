@@ -87,8 +87,9 @@ class NatsPublisher {
   [[nodiscard]] std::optional<Error> take(OutgoingMessage& message) HALVOX_EXCLUDES(mutex_);
   // Accounts for a message that was not queued; its sender gets the error.
   void refuse(const OutgoingMessage& message);
-  // From now on, the last pending acknowledgement calls `wake`, too. Not before: with little
-  // traffic, every acknowledgement is the last one, and would wake the thread for nothing.
+  // After this call, the last pending acknowledgement also calls `wake`. It does not do so before:
+  // with little traffic, every acknowledgement is the last one and would wake the thread for
+  // nothing.
   void beginEnd() HALVOX_EXCLUDES(mutex_);
   // Abandons everything, queued or unacknowledged.
   void abandonAll() HALVOX_EXCLUDES(mutex_);
@@ -103,7 +104,7 @@ class NatsPublisher {
   // Whether publishNext() would publish, provided that a server is connected.
   [[nodiscard]] bool canPublish(Time now) HALVOX_EXCLUDES(mutex_);
 
-  // Link's thread only, down to detach().
+  // The functions from here to detach() are for the link's thread only.
   // Publishes over `context` until detach(). The caller owns `context`. `duplicates` is the time
   // for which the stream recognises identifiers.
   void attach(jsCtx* context, std::chrono::nanoseconds duplicates);

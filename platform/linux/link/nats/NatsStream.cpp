@@ -9,13 +9,13 @@ namespace {
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
 // The limits of a stream that this service creates. A reader can be absent for a month; 4 GiB
-// bounds what a busy service takes of the server's disk in that time.
+// bounds the disk space that a busy service uses on the server in that time.
 constexpr std::int64_t kStreamBytes = std::int64_t{4} << 30;
 constexpr std::chrono::nanoseconds kStreamAge = std::chrono::hours(24 * 30);
 
-// The stream recognises a message identifier for this long. A message is published again for half
-// of it: its last copy may still travel when the time is up, and must find its identifier known.
-// Two minutes is also the default of the server.
+// The stream recognises a message identifier for this long. A message is published again for at
+// most half of this time: the last copy can arrive later, and the stream must still recognise its
+// identifier. Two minutes is also the default of the server.
 constexpr std::chrono::nanoseconds kDuplicatesTime = std::chrono::minutes(2);
 static_assert(kDuplicatesTime >= 2 * NatsPublisher::kAckTime);
 
@@ -40,7 +40,8 @@ StreamProvision provideStream(jsCtx* context, const Configuration::Link& options
     provision.duplicates = std::chrono::nanoseconds(info.get()->Config->Duplicates);
     return provision;
   }
-  // Only a stream that is known not to exist is created. Other failures say nothing about it.
+  // Create the stream only if it is known not to exist. Other failures do not show whether it
+  // exists.
   if (status != NATS_NOT_FOUND && code != JSStreamNotFoundErr) {
     provision.failure = "cannot look up stream " + options.stream + ": " + describe(status);
     return provision;

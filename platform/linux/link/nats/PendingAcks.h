@@ -22,11 +22,11 @@ struct AckWindow {
 };
 
 // The messages that were published and are not yet acknowledged, in the order of their first
-// attempts. The client library has a message, and reports about it by its address, or it was given
-// back and is held here for another attempt. Both count in the window.
+// attempts. A message is either in the client library, which reports about it by its address, or
+// was given back and is held here for another attempt. Both kinds count in the window.
 //
-// After a failure, beginAgain() returns to the oldest message, and nextAgain() gives one after the
-// other to publish again. Nothing new may be added before needsAgain() is false; this keeps the
+// After a failure, beginAgain() goes back to the oldest message, and each nextAgain() returns one
+// message to publish again. Nothing new may be added before needsAgain() is false; this keeps the
 // order.
 // Not thread-safe: the owner locks.
 class PendingAcks {

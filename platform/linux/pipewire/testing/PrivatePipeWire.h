@@ -12,8 +12,8 @@
 namespace halvox::pipewire_testing {
 
 // For tests: a child process with pipes to its standard input and output. The destructor closes the
-// input, sends SIGTERM and waits for the process. A program that cannot be started is one that has
-// ended.
+// input, sends SIGTERM and waits for the process. A program that cannot be started counts as one
+// that has ended.
 class PipedProcess {
  public:
   explicit PipedProcess(const std::vector<std::string>& command);

@@ -88,8 +88,9 @@ Result<void, StoreError> EventFollower::deliverBy(Read read) {
   }
   started_ = true;
   Result<void, StoreError> done = read();
-  // Not after the last record that was delivered: when the filter lets none through, as `newest` 0
-  // does, everything that is stored would count as new the next time.
+  // Continue after the last record that was read, not the last one that was delivered. If the
+  // filter lets none through, as with `newest` 0, all stored records would otherwise count as new
+  // the next time.
   if (done) filter_.after = std::max(filter_.after, reader_.lastRead());
   // Limits the first delivery only: all that comes later is new.
   filter_.newest.reset();
@@ -121,7 +122,7 @@ EventFollower::Change EventFollower::readChanges() {
       if ((event->mask & (IN_DELETE_SELF | IN_MOVE_SELF | IN_IGNORED)) != 0) {
         return Change::kDirectoryGone;
       }
-      // The kernel has dropped events, and some of them may have been of the store.
+      // The kernel has dropped events, and some of them may have concerned the store.
       const bool overflow = (event->mask & IN_Q_OVERFLOW) != 0;
       if (overflow || (event->len > 0 && isStoreFile(event->name))) change = Change::kStoreWritten;
     }

@@ -27,8 +27,8 @@ class EventFollower {
   // not wait for events. Returns an error, after which following ends, when the directory was
   // removed or the database cannot be read.
   Result<void, StoreError> deliver(const StoreReader::EventCallback& callback);
-  // The same for the records of another kind. Do not mix kinds in one follower: it remembers one
-  // position.
+  // Delivers the records of another kind in the same way. Do not mix kinds in one follower: it
+  // remembers one position.
   Result<void, StoreError> deliver(const RecordTable& table,
                                    const StoreReader::RecordCallback& callback);
 

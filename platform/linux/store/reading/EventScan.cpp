@@ -14,7 +14,7 @@ constexpr std::int64_t recordOf(StoredRecordID event) { return event / 2; }
 }  // namespace
 
 SqliteCode EventScan::begin() {
-  // That record itself, and not the next: its second event may be newer than `after`.
+  // Begin with this record and not with the next one: its second event may be newer than `after`.
   bounds_.first = recordOf(filter_.after);
   SqliteCode code = findBounds(database_, "analytics_records", "analytics_spans", filter_, bounds_);
   if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);

@@ -119,7 +119,8 @@ SqliteCode RecordScan::next(std::vector<StoredRecord>& piece) {
 }
 
 bool RecordScan::passes(const Statement& row) const {
-  // The cheap tests first. The caller's condition needs the whole record, so it comes last.
+  // The cheap tests come first. The caller's condition comes last, because it needs the whole
+  // record.
   if (!isWithinTimes(filter_, row.real(kTime))) return false;
   for (const NumberMatch& match : filter_.numbers) {
     const std::int64_t number = row.integer(columnOf(match.column));

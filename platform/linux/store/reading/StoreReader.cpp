@@ -53,7 +53,8 @@ Result<void, StoreError> StoreReader::open(const std::filesystem::path& director
   }
   auto opened = openDatabase();
   if (opened) {
-    // From before the opening: if another file took the name in between, isReplaced() notices.
+    // This identity is from before the opening: if another file took the name in between,
+    // isReplaced() notices.
     identity_ = FileIdentity{status.st_dev, status.st_ino};
   } else {
     database_.close();
@@ -83,7 +84,7 @@ SqliteCode StoreReader::openFile() {
     SqliteCode code = database_.open(file, DatabaseAccess::kReadOnly);
     if (code != SQLITE_OK) return code;
     sqlite3_busy_timeout(database_.get(), static_cast<int>(kBusyTimeout.count()));
-    // SQLite reads the file only when a statement needs it. This one shows whether it can.
+    // SQLite reads the file only when a statement needs it. This statement shows whether it can.
     return database_.execute("PRAGMA schema_version");
   };
   const std::string& path = files_->database().native();

@@ -60,7 +60,7 @@ struct RecordFilter {
   StoredRecordID after = 0;               // only records stored after this one
   std::optional<std::uint64_t> newest{};  // at most this many, the newest
   std::vector<NumberMatch> numbers{};     // all must match; events ignore them
-  // A further condition; events ignore it. It is only asked of records that meet all others.
+  // A further condition; events ignore it. It is called only for records that meet all others.
   std::function<bool(const StoredRecord&)> accepts{};
 };
 
@@ -83,8 +83,8 @@ class StoreReader {
   // order of storing. Delivers what was stored when the call began. Waits up to one second for a
   // locked database. After an error, the events before it have been delivered.
   Result<void, StoreError> forEachEvent(const RecordFilter& filter, const EventCallback& callback);
-  // The same for the records of another kind. A store of an older version that lacks the kind has
-  // no such records, which is not an error.
+  // Reads the records of another kind in the same way. A store of an older version that lacks the
+  // kind has no such records, which is not an error.
   Result<void, StoreError> forEachRecord(const RecordTable& table, const RecordFilter& filter,
                                          const RecordCallback& callback);
 

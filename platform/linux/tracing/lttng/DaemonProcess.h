@@ -9,15 +9,15 @@
 
 namespace halvox::platform::linux_ {
 
-// Identifies a process by its number and its start time, both from the kernel. The kernel reuses
-// numbers, and a signal must not reach another process that got the number later.
+// Identifies a process by its ID and its start time, both from the kernel. The kernel reuses IDs,
+// and a signal must not reach another process that got the ID later.
 //
 // A plain value. Any thread may call.
 struct DaemonProcess {
   pid_t pid = 0;
   std::string startTime{};
 
-  // The process that has the number now. The start time is empty if there is none.
+  // The process that has this ID now. The start time is empty if there is none.
   [[nodiscard]] static DaemonProcess withNumber(pid_t pid);
   // The process that `write` noted in the file; none if the file names no process.
   [[nodiscard]] static std::optional<DaemonProcess> read(const std::filesystem::path& noteFile);

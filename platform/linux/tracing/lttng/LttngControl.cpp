@@ -116,8 +116,8 @@ void LttngControl::removeLeftovers() {
   const MutexLock lock(mutex_);
   std::error_code ignored;
   const bool isRecorded = std::filesystem::exists(scratchDirectory_, ignored);
-  // Asking the tracer's library costs a connection to a daemon that may hang. Most starts need not
-  // ask.
+  // A call of the tracer's library connects to a daemon, which may hang. Most starts do not need
+  // it.
   if (!isRecorded && !daemon_.isNoted()) return;
   // Before the sessions are destroyed: if the daemon is ours, it must have a keeper again.
   daemon_.adopt(namePrefix());
@@ -131,14 +131,15 @@ Result<LttngControl::Recording> LttngControl::begin(const RecordingPlan& plan) {
   std::error_code ignored;
   std::filesystem::create_directories(tracesDirectory_, ignored);
   Recording recording;
-  // The process ID tells these recordings from those that an earlier service left.
+  // The process ID distinguishes these recordings from those that an earlier service left.
   recording.name = namePrefix() + std::to_string(::getpid()) + "-" + std::to_string(++begun_);
   recording.directory = scratchDirectory_ / recording.name;
   if (auto isSetUp = setUp(plan, recording); !isSetUp) {
     discard(recording);
     return std::move(isSetUp).error();
   }
-  // For tests and tools that wait for it. The recording works without it, so errors are ignored.
+  // For tests and tools that wait for it. Errors are ignored, because the recording works without
+  // it.
   std::filesystem::create_directories(recordingDirectory_, ignored);
   std::ofstream(recordingDirectory_ / recording.name).close();
   return recording;
@@ -150,8 +151,8 @@ Result<void> LttngControl::setUp(const RecordingPlan& plan, const Recording& rec
   if (error) {
     return Failure<>{"cannot create " + recording.directory.string() + ": " + error.message()};
   }
-  // Asked at each recording: a daemon that others started is used, and it may end between two
-  // traces.
+  // Check at each recording: the daemon may be one that others started, and may have ended since
+  // the last trace.
   if (::lttng_session_daemon_alive() != 1) {
     if (auto started = daemon_.start(namePrefix()); !started) return started;
   }
@@ -165,7 +166,7 @@ Result<void> LttngControl::setUp(const RecordingPlan& plan, const Recording& rec
   if (done) done = addContexts(handle.get());
   if (done) done = addEvent(handle.get(), plan);
   if (done) done = check(::lttng_start_tracing(name), "start the session");
-  // Nothing was recorded whose end would have to be awaited.
+  // Nothing was recorded, and there is no data to wait for.
   if (!done) static_cast<void>(::lttng_destroy_session_no_wait(name));
   return done;
 }
@@ -173,10 +174,10 @@ Result<void> LttngControl::setUp(const RecordingPlan& plan, const Recording& rec
 Result<void> LttngControl::end(const Recording& recording) {
   const MutexLock lock(mutex_);
   std::error_code ignored;
-  // First: the file promises that events are recorded.
+  // Remove the file first: its presence promises that events are recorded.
   std::filesystem::remove(recordingDirectory_ / recording.name, ignored);
   const char* const name = recording.name.c_str();
-  // Both calls wait until the recording is on the disk. Both are made whatever the first returns.
+  // Both calls wait until the recording is on the disk. Make both, even if the first one fails.
   auto stopped = check(::lttng_stop_tracing(name), "stop the session");
   auto destroyed = check(::lttng_destroy_session(name), "destroy the session");
   return stopped ? destroyed : stopped;
@@ -189,7 +190,7 @@ void LttngControl::discard(const Recording& recording) {
 
 void LttngControl::close() {
   const MutexLock lock(mutex_);
-  // Nothing was recorded, so there is nothing to ask the library for.
+  // Nothing was recorded, and there is nothing to destroy.
   if (begun_ == 0 && !daemon_.isOurs()) return;
   if (daemon_.isOurs()) {
     daemon_.leave();

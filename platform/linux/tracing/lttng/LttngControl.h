@@ -27,8 +27,9 @@ struct RecordingPlan {
 // started is used and left running.
 //
 // Names: a recording has the name of its LTTng session, which begins with the device and inode
-// numbers of the traces' directory. One service at a time has that directory open, so a session
-// with this prefix that exists at the start was left by an earlier service and can be destroyed.
+// numbers of the traces' directory. One service at a time has that directory open. A session with
+// this prefix that exists at the start was therefore left by an earlier service and can be
+// destroyed.
 //
 // Files: each recording writes into a directory of its own below "scratch" in the traces'
 // directory. While it records, an empty file of its name is in the directory "recording" next to
@@ -44,7 +45,7 @@ class LttngControl {
     std::filesystem::path directory{};
   };
 
-  // Does nothing yet.
+  // Does not contact the tracer.
   explicit LttngControl(std::filesystem::path tracesDirectory);
   LttngControl(const LttngControl&) = delete;
   LttngControl& operator=(const LttngControl&) = delete;

@@ -98,7 +98,8 @@ std::shared_ptr<LttngKtraceSession> own(const KtraceService::Session& session, S
 
 bool DeliveryGate::enter() {
   const MutexLock lock(mutex_);
-  // If a trace is read faster than it is analysed, all of its events would be in memory.
+  // Without this wait, all events of a trace that is read faster than it is analysed would be in
+  // memory.
   while (inside_ == most_ && !isStopping_) changed_.wait(mutex_);
   if (isStopping_) return false;
   ++inside_;
@@ -156,13 +157,12 @@ int LttngKtraceService::ktrace_events_range(const Session& session, std::uint32_
 int LttngKtraceService::ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) {
   const auto ours = own(session, State::kMade);
   if (ours == nullptr || queue == nullptr) return kUnsuitable;
-  // Also if the recording fails: the caller ends a trace that it has started, and waits for its
+  // The trace counts as started even if the recording fails: the caller ends it and waits for its
   // completion.
   ours->state = State::kStarted;
   ours->queue = std::move(queue);
   started_.add();
-  // LTTng records every event if the filter is empty, so a session without ranges is not given to
-  // it.
+  // Do not start LTTng for a session without ranges: with an empty filter, it records every event.
   if (ours->ranges.empty()) return 0;
   auto begun = control_.begin({.event = "halvox:kdebug", .filter = ours->filter()});
   if (!begun) {
@@ -195,7 +195,7 @@ void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& sessi
     if (!ended || !isRead) failed_.add();
     control_.discard(*session->recording);
   }
-  // After all batches, on the same queue, so the completion comes after the last event.
+  // Added after all batches, on the same queue: the completion comes after the last event.
   session->queue->async(JobWeight::kMayBlock, [session] {
     // Moved out first: the handler may destroy the session, which releases its handlers.
     if (const auto completion = std::exchange(session->completion, nullptr)) completion();
@@ -217,7 +217,8 @@ bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
     return true;
   };
   const auto take = [&](trace_point point) {
-    // The reader gives each point a wall time. The port promises 0 to sessions that did not ask.
+    // The reader gives each point a wall time. The port promises 0 to sessions that did not enable
+    // wall times.
     if (!session->hasWalltimes) point.walltime = 0;
     batch->add(point);
     return batch->size() < kBatchEvents || deliver();

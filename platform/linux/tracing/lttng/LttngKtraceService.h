@@ -14,9 +14,9 @@ namespace halvox::platform::linux_ {
 
 class LttngKtraceSession;
 
-// Keeps a reader from running further ahead of the queue that it delivers to than a number of
-// batches. Without it a trace that is read faster than its handlers work would be in memory as a
-// whole. Any thread may call; the service owns it.
+// Limits how many batches a reader may be ahead of the queue to which it delivers. Without the
+// limit, a trace that is read faster than its handlers work would be in memory as a whole. Any
+// thread may call; the service owns it.
 class DeliveryGate {
  public:
   explicit DeliveryGate(unsigned most) : most_(most) {}
@@ -45,14 +45,14 @@ class DeliveryGate {
 // Threads: a start waits for the session daemon on the caller's thread, and starts one if there is
 // none. An end returns at once; a thread of the service then stops the recording, reads it back in
 // the order of time, and delivers the events in batches. The composition root owns the service.
-// Failure: logged once and counted, and the session completes all the same. Events that the tracer
-// had no room for are counted and logged once a trace. No file of a trace remains.
+// Failure: logged once and counted, and the session still completes. Events that the tracer had no
+// room for are counted and logged once a trace. No file of a trace remains.
 class LttngKtraceService final : public KtraceService {
  public:
   // All three must outlive the service.
   LttngKtraceService(LttngControl& control, LogService& log, StatisticsService& statistics);
 
-  // From now on nothing waits for queues. Events that have not been delivered are dropped and
+  // After this call, nothing waits for queues. Events that have not been delivered are dropped and
   // counted.
   void stop();
   // Releases the queue. Call it after the queues have ended.
@@ -87,7 +87,7 @@ class LttngKtraceService final : public KtraceService {
   Counter& lost_;
   Counter& lostPackets_;
   DeliveryGate gate_{kBatchesAhead};
-  // Not of a lower quality: a stop waits for it on the reporting queue.
+  // Not a lower quality of service: a stop on the reporting queue waits for this queue.
   QueueOnDemand readingQueue_{
       {"Trace Reading", QualityOfService::kUserInteractive, QueueThreading::kOwnThread}};
 };

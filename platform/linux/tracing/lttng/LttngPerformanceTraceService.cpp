@@ -38,7 +38,7 @@ std::string timeText() {
   return {text.data(), length};
 }
 
-// Names begin with the time, so the oldest trace sorts first.
+// The oldest trace sorts first, because names begin with the time.
 void removeOldTraces(const std::filesystem::path& directory) {
   std::vector<std::filesystem::path> traces;
   std::error_code error;
@@ -114,8 +114,8 @@ class LttngTraceSession final : public KQTraceSession,
   LttngTraceSession& operator=(const LttngTraceSession&) = delete;
   ~LttngTraceSession() override {
     if (!recording_.has_value()) return;
-    // Nobody holds the session: end the recording and delete it without a call of the delegate.
-    // On the queue and not here: ending a recording waits for the tracer.
+    // Nobody holds the session: end the recording and delete it without calling the delegate. Do so
+    // on the queue, because ending a recording waits for the tracer.
     queue_->async(JobWeight::kMayBlock, [work = work_, recording = std::move(*recording_)] {
       work->givenUp.add();
       static_cast<void>(work->end(recording));

@@ -19,7 +19,7 @@ class LttngTraceServices final : public TraceServices {
   PerformanceTraceService& performanceTraces() override { return performanceTraces_; }
   void open() override { control_.removeLeftovers(); }
   void stop() override { ktrace_.stop(); }
-  // Sessions and daemon first: the queues have ended, so nothing can use them any more.
+  // End sessions and daemon first: nothing can use them any more, because the queues have ended.
   void close() override {
     control_.close();
     ktrace_.close();

@@ -9,7 +9,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The library has no call that waits for the daemon, so it is asked again and again.
+// The interval of polling: the library has no call that waits for the daemon.
 constexpr std::chrono::milliseconds kLookEvery{10};
 
 }  // namespace
@@ -25,7 +25,7 @@ void SessionDaemon::adopt(const std::string& ownSessions) {
   TracerKeeper::awaitEarlier(noteFile_, keeperEndsWithin());
   ownSessions_ = ownSessions;
   auto noted = DaemonProcess::read(noteFile_);
-  // Compared by start time too: after a restart of the machine, the number may be that of another
+  // The start time is compared, too: after a restart of the machine, the ID may be that of another
   // process.
   if (!noted || !noted->isAlive()) return forget();
   process_ = std::move(noted);
@@ -54,7 +54,7 @@ Result<void> SessionDaemon::start(const std::string& ownSessions) {
 
 void SessionDaemon::end() {
   if (!process_.has_value()) return;
-  // First the daemon: its keeper would ask it for its sessions, and wait if it hangs.
+  // End the daemon first: its keeper would otherwise ask it for its sessions, and wait if it hangs.
   process_->end(limits_.endsWithin);
   keeper_.release();
   forget();

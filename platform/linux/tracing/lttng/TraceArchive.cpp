@@ -60,7 +60,7 @@ Result<void> addFile(archive* to, const std::filesystem::path& path, const std::
   archive_entry_set_pathname(entry.get(), name.c_str());
   archive_entry_set_filetype(entry.get(), AE_IFREG);
   archive_entry_set_perm(entry.get(), kFilePermissions);
-  // The format has the size before the content, so a file must not change while it is packed.
+  // A file must not change while it is packed, because the format has the size before the content.
   archive_entry_set_size(entry.get(), status.st_size);
   archive_entry_set_mtime(entry.get(), status.st_mtim.tv_sec, 0);
   if (archive_write_header(to, entry.get()) != ARCHIVE_OK) return archiveFailure(to);

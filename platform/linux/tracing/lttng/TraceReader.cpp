@@ -81,7 +81,8 @@ class Sink {
     if (status != BT_MESSAGE_ITERATOR_NEXT_STATUS_OK) return static_cast<Status>(status);
     auto& self = *static_cast<Sink*>(sink);
     for (std::uint64_t index = 0; index < count; ++index) {
-      // The others of the array are released unread: each message has a reference that must be put.
+      // The remaining messages of the array are released unread: each has a reference that must be
+      // put.
       if (self.wantsMore_) self.take(messages[index]);
       bt_message_put_ref(messages[index]);
     }
@@ -94,7 +95,7 @@ class Sink {
   static void count(Get get, const bt_message* message, std::uint64_t& total) {
     std::uint64_t lost = 0;
     const bool isKnown = get(message, &lost) == BT_PROPERTY_AVAILABILITY_AVAILABLE;
-    // An unknown number counts as one, so that a loss never reads as none.
+    // An unknown number counts as one, so that a loss is never reported as 0.
     total += isKnown ? lost : 1;
   }
 
@@ -202,8 +203,8 @@ class TraceGraph {
 
  private:
   static bool find(const char* name, Plugin& plugin) {
-    // Not in the user's directory of plugins, and without a failure because of some other plugin
-    // that cannot be loaded.
+    // Do not search the user's directory of plugins, and do not fail because another plugin cannot
+    // be loaded.
     return bt_plugin_find(name, BT_TRUE, BT_FALSE, BT_TRUE, BT_TRUE, BT_FALSE, plugin.out()) ==
            BT_PLUGIN_FIND_STATUS_OK;
   }

@@ -31,8 +31,8 @@ std::string keeperPath() {
   return !error && std::filesystem::exists(beside, error) ? beside : installed;
 }
 
-// Reads one line, without its end. Empty if it does not come in time or the writer has gone. Byte
-// by byte: the line is short, and nothing after it may be consumed.
+// Reads one line, without its end. Empty if it does not come in time or the writer has gone. Reads
+// byte by byte: the line is short, and nothing after it may be consumed.
 std::string readLine(int descriptor, milliseconds within) {
   const auto deadline = steady_clock::now() + within;
   std::string line;
@@ -78,7 +78,7 @@ Result<DaemonProcess> TracerKeeper::launch(const Ward& ward, DaemonProcess daemo
   keeper_ = *std::move(started);
   // Only this process has the writing end. The kernel closes it, however the process ends.
   whileWeLive_ = std::move(life->writer);
-  // Our copy of the writing end must go, or the end of the keeper would not end the reading.
+  // Close our copy of the writing end. Otherwise our reading would not end when the keeper ends.
   answer->writer.reset();
   const std::string line = readLine(answer->reader.get(), kAnswersWithin);
   const std::string_view text = line;
@@ -104,7 +104,7 @@ void TracerKeeper::awaitEarlier(const std::filesystem::path& noteFile, milliseco
 bool TracerKeeper::release() {
   whileWeLive_.reset();
   if (!keeper_) return false;
-  // After the pipe is closed, which tells the keeper to clean up.
+  // The closed pipe makes the keeper clean up and end.
   const ChildEnd end = keeper_->wait();
   keeper_.reset();
   return end.status >= 0;

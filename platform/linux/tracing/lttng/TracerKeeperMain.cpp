@@ -43,8 +43,8 @@ constexpr std::chrono::seconds kEndsWithin{5};  // after SIGTERM; then it is kil
 
 volatile std::sig_atomic_t silentDaemon = 0;  // the daemon that is being asked; 0: none
 
-// The library waits for a daemon without limit. A daemon that hangs serves nobody, so it is killed,
-// which also ends the wait. If the wait goes on, another daemon was asked: the second alarm then
+// The library waits for a daemon without limit. A daemon that hangs serves nobody. It is killed,
+// which also ends the wait. If the wait continues, it is for another daemon: the second alarm then
 // ends the keeper.
 void onSilence(int /*signal*/) {
   const pid_t daemon = silentDaemon;
@@ -127,7 +127,7 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
 int main(int count, char** arguments) {
   const std::vector<std::string> words(arguments, arguments + count);
   if ((words.size() != 3 && words.size() != 5) || words[2].empty()) return EXIT_FAILURE;
-  // Nobody waits for the daemon when it ends, so it must leave without that.
+  // Nobody calls wait() for the daemon. With SIGCHLD ignored, the kernel removes it when it ends.
   std::signal(SIGCHLD, SIG_IGN);
   std::signal(SIGPIPE, SIG_IGN);
   std::optional<DaemonProcess> daemon;
