@@ -79,7 +79,8 @@ std::string logPrefix(std::string_view unit, std::uint32_t line);
 
 }  // namespace detail
 
-// What one source unit logs with: its category and the name that its lines begin with.
+// Writes the log lines of one source unit. It has the unit's category, and the name with which its
+// lines begin.
 //
 //   kLog.info("found reporting session ", id);
 //

@@ -39,7 +39,7 @@ void appendEscaped(std::string& text, char character) {
     text += character;
     return;
   }
-  // Always three octal digits: a digit that follows must not be read as part of the escape.
+  // Write three octal digits always: a digit that follows must not be read as part of the escape.
   text += '\\';
   for (const unsigned shift : {6U, 3U, 0U}) {
     text += static_cast<char>('0' + ((static_cast<unsigned>(byte) >> shift) & 7U));
@@ -78,7 +78,7 @@ ProtoReader::Tag ProtoReader::readTag() {
 void ProtoReader::readString(std::string& value) {
   const std::uint64_t length = readVarint();
   if (error_) return;
-  // Compared before it is added: `position_ + length` could overflow.
+  // Compare before adding: `position_ + length` could overflow.
   if (length > bytes_.size() - position_) {
     error_ = true;
     return;
@@ -100,7 +100,7 @@ bool ProtoReader::skipBytes(std::uint64_t count) {
   return true;
 }
 
-// Recursive: the depth is bounded.
+// Recursive, with a bounded depth.
 bool ProtoReader::skipValue(std::uint64_t number, ProtoWireType wireType, unsigned depth) {
   switch (wireType) {
     case ProtoWireType::kVarint:
@@ -122,7 +122,7 @@ bool ProtoReader::skipValue(std::uint64_t number, ProtoWireType wireType, unsign
   return fail();  // an end without a start, or one of the two wire types without a meaning
 }
 
-// Recursive: the depth is bounded.
+// Recursive, with a bounded depth.
 bool ProtoReader::skipGroup(std::uint64_t number, unsigned depth) {
   if (depth > kMaximumGroupDepth) return fail();
   for (;;) {

@@ -7,7 +7,8 @@
 namespace halvox::platform {
 namespace {
 
-// A function's static instead of a global: static initialisers of other files may call it.
+// A static variable of a function and not a global, because static initialisers of other files may
+// call this.
 std::optional<Services>& slot() {
   static std::optional<Services> services;
   return services;
@@ -15,7 +16,7 @@ std::optional<Services>& slot() {
 
 const Services& installed() {
   if (!slot().has_value()) {
-    // Not logged: the log is one of the services that are missing.
+    // The message cannot be logged: the log is one of the services that are missing.
     std::fputs("halvox: a platform service was used before the services were installed\n", stderr);
     std::abort();
   }

@@ -24,7 +24,7 @@ Reference allocateRep(std::size_t capacity) {
 
 void addToIndex(DictionaryRep& rep, std::uint32_t entry) {
   const std::uint32_t mask = rep.indexSize - 1;
-  // Not the key's own hash: a client can choose keys that collide in it.
+  // Do not use the key's own hash: a client can choose keys that collide in it.
   std::uint32_t slot = detail::secretHash(rep.entries()[entry].key.text()) & mask;
   while (rep.index[slot] != 0) slot = (slot + 1) & mask;
   rep.index[slot] = entry + 1;

@@ -24,7 +24,7 @@ std::size_t numberOf(const TLMReportingService::Session& session) {
   return dynamic_cast<const FakeTlmReportingSession&>(*session).number();
 }
 
-// The session, category and type of a message, as "session 1 4/1".
+// The session, category and type of a message, such as "session 1 4/1".
 std::string label(const FakeTlmReportingService::SentMessage& message) {
   const std::string owner =
       message.session == 0 ? "single" : "session " + std::to_string(message.session);

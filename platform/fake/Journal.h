@@ -40,7 +40,7 @@ class Journal {
   void note(std::string_view text) { record(JournalKind::kNote, text); }
   void clear();
   // Installs a handler that runs after each entry, on the recording thread, so that a test can look
-  // at the state in between.
+  // at the state between two entries.
   void whenRecorded(std::function<void(const JournalEntry&)> handler);
 
   [[nodiscard]] std::vector<JournalEntry> entries() const;

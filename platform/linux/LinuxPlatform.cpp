@@ -81,8 +81,8 @@ Result<void, int> LinuxPlatform::open() {
   }
   // Open the store before the sockets, so that everything that is accepted can be stored.
   if (const auto opened = adapters_->store.open(); !opened) return startFailure(opened.error());
-  // Only after opening the store, whose lock shows that no other service uses the directory:
-  // another service could still use the files that are removed here.
+  // Remove leftovers only after opening the store. Its lock shows that no other service uses the
+  // directory, and therefore none uses these files.
   adapters_->diagnosticReporters.removeLeftovers();
   adapters_->traces->open();
   adapters_->ioReport.open();
@@ -97,21 +97,22 @@ bool LinuxPlatform::close() {
   // First stop what adds jobs to the queues: captures reply through them.
   adapters_->diagnosticReporters.stop();
   adapters_->notify.stop();  // it adds jobs to queues
-  // Before the queues: a stop of a session may wait for a trace that is still being read.
+  // Stop traces before the queues: a stop of a session may wait for a trace that is still being
+  // read.
   adapters_->traces->stop();
   // A message that was answered without an error reaches the link, and its queue still holds it.
   // Some jobs of these queues may still wait, because they have a lower priority than requests.
   adapters_->dispatch.finish(kQueuesFinishWithin);
   const bool ended = adapters_->dispatch.stop(kJobsEndWithin);
   ended ? adapters_->traces->close() : adapters_->traces->abandon();
-  // After the queues: no session can ask for a callback any more.
+  // Stop the callbacks after the queues: no session can request a callback any more.
   adapters_->linkCallbacks.stop();
   const bool linkEnded = !adapters_->nats || adapters_->nats->close();
-  // After the link: the local one writes to the store until its last message.
+  // Close the store after the link: the local link writes to it until its last message.
   adapters_->store.close();
-  // After everything that counts has ended: sums agree only then.
+  // Log the counters when nothing counts any more: their sums agree only then.
   logStatistics(LogLevel::kInfo, Counters::kCounted);
-  // Last, because everything above may log.
+  // Stop the log last, because everything above may log.
   adapters_->log->stop();
   return ended && linkEnded;
 }

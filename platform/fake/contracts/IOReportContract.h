@@ -180,7 +180,7 @@ TYPED_TEST_P(IOReportContract, SamplesStayAsTheyWere) {
   EXPECT_THAT(this->show(samples), ElementsAre("Amp<1>/Speaker/Stats/pulses 7 pulses"));
 }
 
-// Must hold however soon after the previous session.
+// Must hold however soon one session follows another.
 TYPED_TEST_P(IOReportContract, NoReadingIsUsedThatIsOlderThanTheMoment) {
   this->harness_.set({this->counter(0)});
   this->subscribe("Speaker");

@@ -7,7 +7,7 @@
 
 namespace halvox::platform::linux_ {
 
-// localtime_r() and strftime() cost more than the rest of a line together; lines of the same second
+// localtime_r() and strftime() together cost more than the rest of a line. Lines of the same second
 // share their result.
 void LogLineFormatter::setSecond(std::chrono::sys_seconds second) {
   const std::time_t time = std::chrono::system_clock::to_time_t(second);

@@ -55,7 +55,7 @@ LogMemory::Contents LogMemory::contents() const {
     contents.added = endLine_;
   }
   contents.lines = lines.size();
-  // After the lock: formatting 10,000 lines takes longer than copying them.
+  // Format after releasing the lock: formatting 10,000 lines takes longer than copying them.
   LogLineFormatter formatter;
   for (const Line& line : lines) {
     contents.text += formatter.format({.time = line.time,

@@ -28,7 +28,8 @@ std::filesystem::path modulePath(const Module& module) {
   // A build that is not installed has its modules beside the program. They take precedence over
   // installed ones, which may be of another build.
   if (std::filesystem::exists(beside, error)) return beside;
-  // Relative to the program: an installation that was moved as a whole still finds its modules.
+  // The path is relative to the program: an installation that was moved as a whole still finds its
+  // modules.
   return (directory / HALVOX_MODULES_FROM_PROGRAM / module.file).lexically_normal();
 }
 
@@ -42,7 +43,8 @@ Result<void*> loadModule(const Module& module, const std::filesystem::path& path
   // process at the first call.
   void* const library = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
   if (library == nullptr) return failure(lastError());
-  // Before the entry point: a module of another release may have one of the same name.
+  // Check the version before the entry point: a module of another release may have an entry point
+  // of the same name.
   const auto* const version = static_cast<const char*>(::dlsym(library, kVersionSymbol));
   if (version == nullptr) return failure(path.native() + " is not a module of this service");
   if (std::string_view(version) != halvoxVersion()) {

@@ -16,7 +16,7 @@ constexpr std::uint32_t kVanishing = IN_MOVED_FROM | IN_DELETE;
 // IN_CLOSE_WRITE and not IN_MODIFY: a save is one change, however many writes it makes. IN_ATTRIB
 // notices `touch`.
 constexpr std::uint32_t kChanging = IN_CLOSE_WRITE | IN_ATTRIB | kAppearing | kVanishing;
-// After one of these the watches may be incomplete, and all are made again.
+// After one of these events the watches may be incomplete, and all are made again.
 constexpr std::uint32_t kGone = kLeaving | IN_IGNORED | IN_UNMOUNT | IN_Q_OVERFLOW;
 
 bool isMissing(std::error_code error) {
@@ -41,7 +41,8 @@ std::error_code DirectoryWatch::arm(std::vector<std::filesystem::path> directori
   // The descriptors of the old instance mean nothing to the new one.
   watches_.clear();
   isThere_.assign(directories_.size(), false);
-  // A new instance instead of removing watches one by one: events of the old watches go with it.
+  // A new instance, instead of removing watches one by one: the events of the old watches disappear
+  // with the old instance.
   inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (!inotify_) return lastError();
   std::error_code first;

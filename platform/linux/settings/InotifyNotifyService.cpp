@@ -78,7 +78,7 @@ NotifyStatus InotifyNotifyService::notify_register_dispatch(std::string_view nam
 }
 
 bool InotifyNotifyService::ensureRunning() {
-  // A service in which nothing registers has no thread for this.
+  // The first registration starts the thread: a service without registrations needs none.
   if (thread_.joinable()) return true;
   wake_.reset(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
   if (!wake_) return false;

@@ -19,7 +19,7 @@ constexpr std::size_t kLongestReason = 400;
 
 Failure<> problem(const std::filesystem::path& file, std::string_view what) {
   Failure<> error;
-  // The path as a whole: it is what the user needs to find the file.
+  // Do not cut the path: the user needs all of it to find the file.
   appendEscaped(error.message, file.native(), std::numeric_limits<std::size_t>::max());
   appendEscaped(error.message, what, kLongestReason);
   return error;
@@ -64,8 +64,8 @@ std::optional<std::filesystem::path> preferencePath(const std::filesystem::path&
 
 Result<std::optional<PreferenceText>> readPreferenceText(const std::filesystem::path& file) {
   auto content = readText(file);
-  // Before parsing: the parser bounds brackets but not dotted keys, and walking through the tables
-  // of a key of 100,000 words ran out of stack.
+  // Check before parsing: the parser bounds brackets but not dotted keys, and walking through the
+  // tables of a key of 100,000 words ran out of stack.
   if (content && content->has_value() && isNestedTooDeep((*content)->text)) {
     return problem(file, ": expected at most " + std::to_string(kDeepestNesting) +
                              " levels of tables and arrays, found more");

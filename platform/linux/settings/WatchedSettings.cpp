@@ -57,7 +57,8 @@ SettingBaseline WatchedSettings::look(const std::string& name) const {
 }
 
 void WatchedSettings::add(const std::string& name, SettingBaseline&& baseline) {
-  // Compared with the current state once: it may have changed since the baseline was taken.
+  // Note each new entry as changed, so that it is compared once: it may have changed since the
+  // baseline was taken.
   if (names_.known.emplace(name, NotifyFile{baseline.file}).second) names_.news.insert(name);
   for (auto& [domain, values] : baseline.domains) {
     if (domains_.known.emplace(domain, std::move(values)).second) domains_.news.insert(domain);
@@ -133,7 +134,7 @@ bool WatchedSettings::settleDomain(const std::string& domain) {
     return false;
   }
   Dictionary& known = domains_.known[domain];
-  // A save without a change, or a change of another application's values.
+  // The file was saved, but the values of this domain are the same.
   if (*now == known) {
     counters_.noticed.add();
     counters_.unchanged.add();

@@ -34,7 +34,7 @@ AnalyticsRecords::AnalyticsRecords(EventNames& names, WriterQueue& queue,
       names_(names) {}
 
 void AnalyticsRecords::add(double time, std::string_view name, AnalyticsPayloadBuilder builder) {
-  // Outside the queue's lock, which all senders share: the name is looked up without a lock.
+  // Look the name up outside the queue's lock, which all senders share. The look-up needs no lock.
   Event event{time, names_.find(name), nullptr, std::move(builder)};
   if (event.name == nullptr) {
     event.ownName = std::make_unique<EventName>(name, true);
@@ -45,7 +45,7 @@ void AnalyticsRecords::add(double time, std::string_view name, AnalyticsPayloadB
 
 void AnalyticsRecords::takeQueued() {
   taken_.clear();
-  // Before the swap: the emptied vector is the one to which events are added next.
+  // Free the memory before the swap: the emptied vector is the one to which events are added next.
   if (taken_.capacity() > kKeptEvents) taken_ = std::vector<Event>();
   taken_.swap(queued_);
   next_ = 0;
@@ -130,7 +130,7 @@ SqliteCode AnalyticsRecords::identify(EventName& name) {
   // The usual case: the same names come again and again.
   if (name.generation == generation_) return SQLITE_OK;
   statements_.insertName.bind(1, name.text);
-  // Inserted first and looked up afterwards: the name may be in the database from an earlier run.
+  // Insert first and look up afterwards: the name may be in the database from an earlier run.
   SqliteCode code = statements_.insertName.run();
   if (code != SQLITE_OK) return code;
   statements_.findName.bind(1, name.text);

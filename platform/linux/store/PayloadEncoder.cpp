@@ -231,7 +231,7 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
       case NumberKind::kBool:
         Bool(value.toBool());
         return;
-      // Not as a double: the shortest form of 0.1F is "0.1" as a float, and
+      // Do not write it as a double: the shortest form of 0.1F is "0.1" as a float, and
       // "0.10000000149011612" as a double.
       case NumberKind::kFloat:
         return addReal(static_cast<float>(value.toDouble()));
@@ -268,7 +268,7 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
 
   void addDate(Date date) {
     const double seconds = date.secondsSince1970;
-    // Negated, so that NaN is not taken for a date.
+    // The condition is negated so that NaN does not count as a date.
     if (!(seconds >= kEarliest && seconds < kEnd)) return addReal(seconds);
     std::array<char, 64> buffer;
     addPlain(dateText(seconds, buffer));

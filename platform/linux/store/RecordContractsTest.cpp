@@ -1,4 +1,4 @@
-// The contracts of analytics, metrics and the power log, kept by the services that record in the
+// The contracts of analytics, metrics and the power log, run on the services that record in the
 // store.
 
 #include <memory>

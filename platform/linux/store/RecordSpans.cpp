@@ -9,8 +9,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// How many records deleteOldest() deletes. Few, because their payloads may be large, and retention
-// measures the free space after each step.
+// How many records deleteOldest() deletes. The number is small, because payloads may be large and
+// retention measures the free space after each step.
 constexpr std::int64_t kRecordsPerStep = 64;
 
 // Returns the statement with the names of the tables in place of $records and $spans.
@@ -121,7 +121,7 @@ SqliteCode RecordSpans::deleteOldest(bool& found) {
   statements_.deleteRecords.bind(2, first + kRecordsPerStep - 1);
   code = statements_.deleteRecords.run();
   if (code != SQLITE_OK) return code;
-  // Only spans whose numbers are all deleted. The span of the next oldest record stays.
+  // Delete only spans whose records are all deleted. The span of the oldest remaining record stays.
   statements_.deleteEmptySpans.bind(1, (first + kRecordsPerStep) / kRecordsPerSpan);
   return statements_.deleteEmptySpans.run();
 }

@@ -20,7 +20,7 @@ struct RecordColumn {
 struct RecordTable {
   std::string_view records;               // the table of the records
   std::string_view spans;                 // the table of their first and last times
-  std::span<const RecordColumn> columns;  // after the two that all kinds have: id and time
+  std::span<const RecordColumn> columns;  // after id and time, which all kinds have
   std::size_t nameColumn;                 // the column that name patterns match, or kNoColumn
   std::int64_t sinceVersion;              // the schema version that introduced the kind
   std::string_view piece;                 // the name under which its records are counted

@@ -127,7 +127,8 @@ SqliteCode Retention::deleteAged(double now, std::span<RecordKind* const> kinds,
     });
     if (code != SQLITE_OK) return code;
     if (!found) {
-      // Only when nothing remains to be deleted. Otherwise the next round continues at once.
+      // Set the next time only when nothing remains to be deleted. Otherwise the next round
+      // continues at once.
       nextByAge_ = std::chrono::steady_clock::now() + kAgeInterval;
       return SQLITE_OK;
     }
@@ -139,7 +140,7 @@ SqliteCode Retention::deleteAged(double now, std::span<RecordKind* const> kinds,
 SqliteCode Retention::deleteForSize(std::span<RecordKind* const> kinds, bool& more) {
   for (int step = 0; step < kSizeSteps; ++step) {
     SqliteCode code = readUse();
-    // Measured again after each step: the records that it deletes may be large or small.
+    // Measure again after each step: the records that it deletes may be large or small.
     if (code != SQLITE_OK || !isFull()) return code;
     bool found = false;
     code = deleteOldest(kinds, found);

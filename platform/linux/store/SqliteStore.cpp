@@ -77,7 +77,7 @@ void SqliteStore::run() {
   };
   while (queue_.take(nextRound_, takeAll)) {
     nextRound_ = std::chrono::steady_clock::now() + queue_.limits().gatherTime;
-    // Before the records are written, which then go into the new database.
+    // Replace a damaged database before writing the records, which then go into the new one.
     if (const auto finding = check_.finding()) replaceDamaged(*finding);
     writeTaken();
     maintainWhileIdle();
@@ -91,8 +91,8 @@ void SqliteStore::writeTaken() {
     const SqliteCode code = writeTransaction();
     if (code != SQLITE_OK) return fail(code, "cannot store records");
     onStored();
-    // After every transaction, not only when idle: under a steady flood the writer never is, and
-    // the file must not outgrow its limit.
+    // Do this after every transaction, and not only when the writer is idle: under a steady flood
+    // it never is, and the file must not outgrow its limit.
     static_cast<void>(maintainOnce());
   }
 }
@@ -104,7 +104,8 @@ bool SqliteStore::hasTaken() const {
 // Opens the database if it is not open, or if its path now leads to another file or to none:
 // records in a file without a name would be lost. Returns false after dropping the taken records.
 bool SqliteStore::makeReady() {
-  // One stat() for each transaction: SQLite does not notice that its file has lost its name.
+  // This costs one stat() for each transaction: SQLite does not notice that its file has lost its
+  // name.
   if (database_.isOpen() && files_.identity() == identity_) return logHasRoom();
   if (database_.isOpen()) {
     kLog.error(files_.database().c_str(),
@@ -197,7 +198,7 @@ void SqliteStore::replaceDamaged(const std::string& finding) {
     kLog.error("cannot copy all records that were stored since the start; the others are only in ",
                *newName, ": ", problem);
   }
-  // After the copy, so that numbering continues after the copied records.
+  // Call this after the copy, so that numbering continues after the copied records.
   if (useDatabase() != SQLITE_OK) kLog.error("", cannotRead().message);
 }
 

@@ -168,7 +168,7 @@ StoreCheck::Outcome StoreCheck::readTable(Database& database, const std::string&
     rows.bind(1, last);
     rows.bind(2, newest);
     code = readSlice(rows, last, records_);
-    // Before the reset, which may replace the error.
+    // Read the error before the reset, which may replace it.
     if (code != SQLITE_ROW && code != SQLITE_DONE) what = table + ": " + database.errorText();
     // Ends the transaction before the pause.
     rows.reset();
@@ -179,7 +179,8 @@ StoreCheck::Outcome StoreCheck::readTable(Database& database, const std::string&
 }
 
 bool StoreCheck::pause(Clock::duration length) {
-  // As long as the slice took: on a busy disk, the check takes at most half of its time.
+  // Pause for as long as the slice took: on a busy disk, the check uses at most half of the disk's
+  // time.
   const auto until = Clock::now() + std::max<Clock::duration>(length, kShortestPause);
   const MutexLock lock(mutex_);
   while (!isStopping_ && stopping_.waitUntil(mutex_, until)) {

@@ -60,7 +60,7 @@ class StoreCheckTest : public StoreFixture {
 
  private:
   // A checkpoint copies nothing while the writer makes one of its own. Damage to the database would
-  // then not count, because the log still has all pages.
+  // then have no effect, because the log still has all pages.
   [[nodiscard]] bool isLogCopied() const {
     Database connection;
     Statement checkpoint;

@@ -56,7 +56,8 @@ std::string pragmas(const StoreSizes& sizes) {
 Result<void, StoreError> examine(const StoreFiles& files, Database& database) {
   SqliteCode code = database.open(files.database(), DatabaseAccess::kReadWrite);
   if (code != SQLITE_OK) return judged(code, files, database);
-  // Before the first statement: another program may hold a lock while the service starts.
+  // Set the time-out before the first statement: another program may hold a lock while the service
+  // starts.
   sqlite3_busy_timeout(database.get(), static_cast<int>(kBusyTimeout.count()));
   // Reads the first page. This detects a file that is not a database before anything changes it.
   code = database.execute("PRAGMA schema_version");
@@ -71,7 +72,7 @@ Result<void, StoreError> examine(const StoreFiles& files, Database& database) {
                        " or older, found version " + std::to_string(*version) +
                        ", made by a newer release");
   }
-  // SQLite opens a file that it cannot write to without an error, for reading only.
+  // If SQLite cannot write to a file, it opens the file for reading only, without an error.
   if (sqlite3_db_readonly(database.get(), "main") == 1) {
     return failure(StoreError::kDirectory, files, "cannot write to the database file");
   }

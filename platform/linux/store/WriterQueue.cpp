@@ -70,7 +70,7 @@ void WriterQueue::finish(std::uint64_t records, std::uint64_t bytes) {
     relieve = backpressure_.isHigh() && waiting_ <= softRecords_ / 4;
   }
   if (wakeCallers) room_.notifyAll();
-  // Outside the lock: the handler wakes the I/O thread, which may add records at once.
+  // Call it outside the lock: the handler wakes the I/O thread, which may add records at once.
   if (relieve) backpressure_.relieve();
 }
 

@@ -180,8 +180,8 @@ std::optional<Value> PlistPropertyListService::parse(const std::optional<Data>& 
   if (span.empty()) return fail("is empty");
   if (span.size() > kMostFileBytes) return fail("is too large");
   const std::string_view text(reinterpret_cast<const char*>(span.data()), span.size());
-  // Before the library sees a byte: it recurses, copies shared objects, and ends the process by
-  // assertions.
+  // Check before the library sees a byte: it recurses, copies shared objects, and ends the process
+  // by assertions.
   if (const auto reason = whyUnreadable(text, kBounds)) return fail(*reason);
   List list;
   const auto length = static_cast<std::uint32_t>(text.size());

@@ -190,10 +190,10 @@ class BinaryShape {
     if (child >= objects_) return kNotBinary;
     switch (weights_[child].state) {
       case Weight::State::kNew:
-        // Before the child is read: the stack of a list that nests without end must not grow with
-        // it.
+        // Check the depth before reading the child: otherwise the stack would grow without end with
+        // a list that nests without end.
         if (open_.size() > bounds_.depth) return kTooDeep;
-        return push(child);  // and looks at it again when it is done
+        return push(child);  // and continues here when the child is done
       case Weight::State::kOpen:
         return "contains itself";
       case Weight::State::kDone:

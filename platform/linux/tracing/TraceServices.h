@@ -27,7 +27,7 @@ class TraceServices {
   [[nodiscard]] virtual KtraceService& ktrace() = 0;
   [[nodiscard]] virtual PerformanceTraceService& performanceTraces() = 0;
   // Removes what an earlier service with the same storage directory did not remove. Waits for the
-  // tracer only if there is anything.
+  // tracer only if something remains.
   virtual void open() = 0;
   // Lets running traces end soon: after this call, nothing waits for a queue. Call it before the
   // queues end.

@@ -37,7 +37,7 @@ class CallbackThread {
   Mutex mutex_;
   std::deque<Callback> waiting_ HALVOX_GUARDED_BY(mutex_);
   bool isRunning_ HALVOX_GUARDED_BY(mutex_) =
-      false;  // the thread will see waiting_ again before it ends
+      false;  // the thread checks waiting_ again before it ends
   bool isStopped_ HALVOX_GUARDED_BY(mutex_) = false;
   std::thread thread_ HALVOX_GUARDED_BY(mutex_);
 };

@@ -72,7 +72,7 @@ void AckLedger::giveUp(FlushId id) {
     flushes_.erase(flush);
   }
   ended.tally.notAcknowledged += ended.outstanding;
-  // Without the lock: the callback may send or flush again.
+  // Call it without the lock: the callback may send or flush again.
   ended.done(ended.tally);
 }
 

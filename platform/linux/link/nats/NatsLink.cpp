@@ -44,8 +44,8 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
     if (!isRefused) failure = provideThread();
     if (!isRefused && failure.empty()) {
       wakeThread();
-      // Not called from here: `found` must run later, on a thread of ours. The session logs that it
-      // waits after this returns.
+      // Do not call `found` from here: it must run later, on a thread of ours. The session logs
+      // that it waits after this returns.
       if (state_ == State::kConnected) return answers_.push_back({std::move(found), servers_});
       waiter = ++lastWaiter_;
       waiters_.push_back({waiter, std::exchange(found, nullptr)});
@@ -115,7 +115,7 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
       return std::nullopt;
     }
   }
-  // Without the lock: the ledger may call back a flush, which may send.
+  // Refuse it without the lock: the ledger may call back a flush, which may send.
   publisher_.refuse(message);
   return error;
 }
@@ -256,7 +256,7 @@ void NatsLink::run() {
       step = nextStep(std::chrono::steady_clock::now());
       if (step == Step::kWait) waitForChange();
     }
-    // Without the lock: most steps call the library, and some wait for a server.
+    // Perform the step without the lock: most steps call the library, and some wait for a server.
     if (!perform(step)) return;
   }
 }
@@ -318,7 +318,7 @@ void NatsLink::answerWaiters() {
     if (state_ == State::kConnected) servers = servers_;
   }
   callBackAnswers();
-  // Without the lock: a callback may ask or send again.
+  // Call them without the lock: a callback may call discover() or send() again.
   for (const Waiter& waiter : waiters) waiter.found(servers);
 }
 

@@ -67,7 +67,8 @@ natsStatus secure(natsOptions* options, const Configuration::Link& link) {
   if (status == NATS_OK && !tls.certificate.empty()) {
     status = natsOptions_LoadCertificatesChain(options, tls.certificate.c_str(), tls.key.c_str());
   }
-  // Only if the configuration says so. The library checks certificates and names by default.
+  // Skip verification only if the configuration says so. The library checks certificates and names
+  // by default.
   if (status == NATS_OK && !tls.verify) {
     status = natsOptions_SkipServerVerification(options, true);
   }
@@ -144,7 +145,7 @@ void NatsLink::connect() {
   }
   NatsConnection connection;
   JetStreamContext context;
-  // Without the lock, because this can take seconds. Callers only queue meanwhile.
+  // Connect without the lock, because this can take seconds. Callers only queue meanwhile.
   const std::string failure = open(connection, context);
   if (!failure.empty()) {
     if (connection) natsConnection_Close(connection.get());
@@ -218,7 +219,7 @@ void NatsLink::dropConnection() {
     servers_ = Array();
     isEnding = closeBy_.has_value();
   }
-  // Before the connection is closed, because that can hang until a server answers.
+  // Detach before closing the connection, which can hang until a server answers.
   publisher_.detach();
   if (isEnding) publisher_.failQueued("the service ended");
   if (connection) natsConnection_Close(connection.get());

@@ -17,8 +17,8 @@ constexpr std::string_view kErrorDomain = "com.tarno.halvox.link";
 // lock; senders would otherwise wait while it writes.
 constexpr std::size_t kMessagesAtOnce = 64;
 
-// Without an acknowledgement in this time a message counts as lost. Much longer than a busy server
-// needs, and short enough for a second attempt within the 5 seconds of a flush.
+// A message without an acknowledgement in this time counts as lost. The time is much longer than a
+// busy server needs, and short enough for a second attempt within the 5 seconds of a flush.
 constexpr std::chrono::milliseconds kAttemptTime{3000};
 constexpr std::chrono::milliseconds kProbeTime{1000};
 
@@ -84,7 +84,7 @@ void NatsPublisher::abandonAll() {
     lost = pending_.takeAll();
     unsent = takeQueue();
   }
-  // Without the lock: the ledger may call back a flush, which may send.
+  // Call these without the lock: the ledger may call back a flush, which may send.
   abandon(lost, "the connection ended");
   fail(unsent, "the service ended");
 }
@@ -335,8 +335,8 @@ void NatsPublisher::resolve(NatsMessage message, const jsPubAckErr* error) {
   {
     const MutexLock lock(mutex_);
     entry = pending_.take(message.get());
-    // Freed here: once the thread sees that nothing is pending, it may end the library, which must
-    // not happen before the message is destroyed.
+    // Free the message here: once the thread sees that nothing is pending, it may end the library,
+    // which must not happen before the message is destroyed.
     message.reset();
     const bool isProbed = flow_ == Flow::kProbing;
     if (isProbed) flow_ = Flow::kFlowing;

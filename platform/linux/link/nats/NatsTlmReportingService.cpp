@@ -127,7 +127,7 @@ TLMReportingOutcome NatsTlmReportingService::TLMReportingSendOneMessage(
 TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
                                                   const TLMReportingMessage& message) {
   if (auto ending = link_->refuseAtEnd()) return {.sent = false, .error = std::move(ending)};
-  // Encoded here, on the session's queue: one thread serves the link of all sessions.
+  // Encode here, on the session's queue: one thread serves the link of all sessions.
   const std::string_view payload = encoder().encode(message.payload);
   std::string body;
   body.reserve(session.beginning().size() + payload.size() + 48);
@@ -154,7 +154,7 @@ TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
   }
   outgoing.bytes = body.size() + kHeaderBytes;
   outgoing.ledger = session.ledger();
-  // Before the message is sent, because its acknowledgement may come before send() returns.
+  // Add it before sending the message, whose acknowledgement may arrive before send() returns.
   if (outgoing.ledger) outgoing.number = outgoing.ledger->add();
   std::optional<Error> error = link_->send(std::move(outgoing));
   const bool sent = !error.has_value();
@@ -178,7 +178,7 @@ void NatsTlmReportingService::TLMReportingFlushMessages(const Session& session,
         flushed();
       });
   if (flush == 0) return;
-  // Weak: a flush that ended in time must not keep its session's account.
+  // The job holds a weak reference: a flush that ended in time must not keep its session's account.
   dispatch_.asyncAfterOnBackgroundQueue(kFlushTime, [ledger = std::weak_ptr(ledger), flush] {
     if (const auto held = ledger.lock()) held->giveUp(flush);
   });

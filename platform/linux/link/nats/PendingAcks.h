@@ -14,8 +14,8 @@
 
 namespace halvox::platform::linux_ {
 
-// How much may be published without an acknowledgement: what has to be published again after a
-// failure, and what the client library holds in addition to our queue.
+// How much may be published and not yet acknowledged. It bounds what must be published again after
+// a failure, and what the client library holds in addition to our queue.
 struct AckWindow {
   std::size_t messages = 8192;
   std::size_t bytes = 16U << 20U;

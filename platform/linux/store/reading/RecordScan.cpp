@@ -82,7 +82,7 @@ SqliteCode RecordScan::prepare(std::string_view order, Statement& statement) {
 
 SqliteCode RecordScan::skipToNewest(std::uint64_t count) {
   Statement statement;
-  // From the newest back, so that no more records are read than are wanted.
+  // Read from the newest record back, so that no more records are read than are wanted.
   SqliteCode code = prepare("DESC", statement);
   if (code != SQLITE_OK) return code;
   statement.bind(1, bounds_.first);
@@ -107,7 +107,7 @@ SqliteCode RecordScan::next(std::vector<StoredRecord>& piece) {
   for (int looks = 0; looks < kLooksPerPiece; ++looks) {
     code = read_.step();
     if (code != SQLITE_ROW) break;
-    // Also for a record that does not pass: the next piece must not look at it again.
+    // Advance past a record that does not pass, too: the next piece must not read it again.
     bounds_.first = read_.integer(kID) + 1;
     if (passes(read_)) piece.push_back(read(read_, bytes));
     if (piece.size() >= kRecordsPerPiece || bytes >= kBytesPerPiece) break;

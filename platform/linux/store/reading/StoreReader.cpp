@@ -118,7 +118,7 @@ Result<void, StoreError> StoreReader::forEachRecord(const RecordTable& table,
                                                     const RecordFilter& filter,
                                                     const RecordCallback& callback) {
   if (!database_.isOpen()) return Failure<StoreError>{StoreError::kMissing, "no store is open"};
-  // Read for each call: a service may have migrated the store since it was opened.
+  // Read the version for each call: a service may have migrated the store since it was opened.
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   lastRead_ = 0;

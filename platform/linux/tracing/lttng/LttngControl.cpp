@@ -119,7 +119,7 @@ void LttngControl::removeLeftovers() {
   // A call of the tracer's library connects to a daemon, which may hang. Most starts do not need
   // it.
   if (!isRecorded && !daemon_.isNoted()) return;
-  // Before the sessions are destroyed: if the daemon is ours, it must have a keeper again.
+  // Adopt the daemon before destroying the sessions: if it is ours, it must have a keeper again.
   daemon_.adopt(namePrefix());
   if (::lttng_session_daemon_alive() == 1) destroyTracerSessions(namePrefix());
   std::filesystem::remove_all(recordingDirectory_, ignored);

@@ -93,7 +93,8 @@ struct LttngPerformanceTraceService::Work {
     const std::filesystem::path archive = control.tracesDirectory() / name;
     const auto packed = packDirectory(recording.directory, archive);
     if (!packed) return traceError("cannot save the trace: " + packed.error().message);
-    // After the new archive is complete: a failure must not cost an old trace.
+    // Delete old traces only after the new archive is complete: a failure must not cost an old
+    // trace.
     removeOldTraces(control.tracesDirectory());
     url = "file://" + archive.string();
     return std::nullopt;

@@ -38,7 +38,7 @@ class LttngPerformanceTraceService final : public PerformanceTraceService {
 
  private:
   const std::shared_ptr<Work> work_;  // shared with the sessions
-  // Not a lower quality of service: a stop on the reporting queue waits for this queue.
+  // A lower quality of service would be wrong: a stop on the reporting queue waits for this queue.
   QueueOnDemand queue_{
       {"Performance Trace", QualityOfService::kUserInteractive, QueueThreading::kOwnThread}};
 };

@@ -93,13 +93,14 @@ Result<void> write(const std::filesystem::path& directory, int file) {
 
 Result<void> packDirectory(const std::filesystem::path& directory,
                            const std::filesystem::path& archive) {
-  // In the scratch directory: what a killed service leaves there is removed at the next start.
+  // The unfinished file is in the scratch directory, where the next start removes what a killed
+  // service left.
   const std::filesystem::path unfinished = directory.string() + ".unfinished";
   constexpr int kFlags = O_WRONLY | O_CREAT | O_TRUNC | O_CLOEXEC | O_NOFOLLOW;
   const UniqueFd file(::open(unfinished.c_str(), kFlags, kArchivePermissions));
   if (!file) return systemFailure(unfinished);
   Result<void> done = write(directory, file.get());
-  // Before the name: after a power cut, an archive with a name must have its content.
+  // Sync before the rename: after a power cut, an archive that has its name must have its content.
   if (done && ::fsync(file.get()) != 0) done = systemFailure(unfinished);
   if (done && ::rename(unfinished.c_str(), archive.c_str()) != 0) done = systemFailure(archive);
   if (!done) ::unlink(unfinished.c_str());

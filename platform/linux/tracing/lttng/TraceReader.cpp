@@ -267,7 +267,7 @@ class TraceGraph {
 
 }  // namespace
 
-// In integers where possible: a double has 53 bits, and nanoseconds since 1970 need 61.
+// Calculates in integers where possible: a double has 53 bits, and nanoseconds since 1970 need 61.
 std::uint64_t TraceClock::toNanoseconds(std::uint64_t ticks) const {
   const std::uint64_t sum = ticks + offsetTicks;
   const std::uint64_t seconds = sum / ticksPerSecond + static_cast<std::uint64_t>(offsetSeconds);

@@ -62,8 +62,8 @@ Result<DaemonProcess> TracerKeeper::launch(const Ward& ward, DaemonProcess daemo
   if (!life) return Failure<>{failed + life.error().message};
   auto answer = makePipe();
   if (!answer) return Failure<>{failed + answer.error().message};
-  // A session of its own: a Ctrl-C in the service's terminal must not end the keeper before the
-  // traces are read.
+  // The keeper runs in a session of its own: a Ctrl-C in the service's terminal must not end the
+  // keeper before the traces are read.
   ChildProgram program{.command = {path, ward.noteFile.string(), ward.ownSessions},
                        .descriptors = {{.number = STDIN_FILENO, .ours = life->reader.get()},
                                        {.number = STDOUT_FILENO, .ours = answer->writer.get()},

@@ -111,7 +111,7 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
   // Errors are ignored: the note is needed only by a service that starts after this keeper was
   // killed.
   static_cast<void>(daemon->write(noteFile));
-  // After the note is written: a service that has this answer can be killed, and the next one finds
+  // Answer only after the note is written. If the service is then killed, the next one still finds
   // the daemon.
   say(std::to_string(daemon->pid) + " " + daemon->startTime);
   awaitEndOfService();
