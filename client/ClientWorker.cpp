@@ -20,20 +20,22 @@ constexpr std::size_t kMaxWaitingOperations = 8192;
 constexpr std::chrono::seconds kFarewell{1};
 // How often to look for work if there is no descriptor through which producers can wake the thread.
 constexpr std::chrono::milliseconds kPauseWithoutWakeUp{50};
-// While messages come, the worker naps instead of sleeping. A nap lasts an eighth of the time since
-// the last message, within these bounds. The shortest gathers messages; the longest costs a
-// real-time client a hundred wake-ups a second while a session runs, about as many as its audio
-// has.
+// While messages arrive, the worker naps instead of sleeping. A nap lasts an eighth of the time
+// since the last message, within these bounds. During the shortest nap, several messages can gather
+// for one write. The longest nap costs a real-time client a hundred wake-ups a second while a
+// session runs, about as many as its audio thread makes.
 constexpr std::chrono::milliseconds kShortestNap{1};
 constexpr std::chrono::milliseconds kLongestNap{10};
 constexpr int kNapShare = 8;
-// How long after a message the worker naps. A client that sends twenty messages a second or more is
-// never woken; one that sends fewer is woken for each, and wakes up some twenty times after it.
+// How long after a message the worker naps. A client that sends at least twenty messages a second
+// never has to wake this thread. A slower client wakes it for each message, and the thread then
+// wakes up about twenty more times by itself.
 constexpr std::chrono::milliseconds kNapsAfterMessage{50};
-// How long a flush does the worker's work itself. The service answers a request within microseconds
-// unless it is busy, and then a change of threads does not matter.
+// How long the thread that calls flush() does the worker's work itself. The service answers a
+// request within microseconds unless it is busy. If it is busy, the cost of switching threads does
+// not matter.
 constexpr std::chrono::milliseconds kLongestHelp{2};
-// Stands for "wait for ever": larger durations could overflow the clock's time points.
+// Stands for "wait forever": larger durations could overflow the clock's time points.
 constexpr std::chrono::hours kLongestWait{24 * 365};
 
 Options withDefaults(Options options) {
@@ -47,7 +49,7 @@ Options withDefaults(Options options) {
   return options;
 }
 
-// Waits for events on the descriptors until the deadline at most.
+// Waits for events on the descriptors, at most until the deadline.
 void pollUntil(std::span<pollfd> polled, std::chrono::steady_clock::time_point deadline) {
   timespec remaining{};
   const bool forEver = deadline == std::chrono::steady_clock::time_point::max();
@@ -77,7 +79,8 @@ ClientWorker::ClientWorker(Options options)
 
 ClientWorker::~ClientWorker() {
   if (!isOwnProcess()) {
-    // After a fork() the thread is only in the parent, and so is the right to use the connection.
+    // After fork(), the thread exists only in the parent, and only the parent may use the
+    // connection.
     thread_.detach();
     return;
   }
@@ -96,7 +99,7 @@ ClientWorker::~ClientWorker() {
 }
 
 bool ClientWorker::send(const MessageView& message) {
-  // Relaxed is enough: a program that sends while it destroys its client has a race of its own.
+  // Relaxed is enough: a program that sends while it destroys its client has a data race anyway.
   const bool isClosing = closing_.load(std::memory_order_relaxed);
   switch (isClosing ? EncodeOutcome::kNoRoom : ring_.tryPush(message)) {
     case EncodeOutcome::kNoRoom:
@@ -108,7 +111,7 @@ bool ClientWorker::send(const MessageView& message) {
     case EncodeOutcome::kDone:
       break;
   }
-  // Wake the thread only if it sleeps for lack of work. While it naps it comes by itself.
+  // Wake the thread only if it sleeps. While it naps, it wakes up by itself.
   if (asleep_.load(std::memory_order_seq_cst) && asleep_.exchange(false)) wake();
   return true;
 }
@@ -127,7 +130,7 @@ void ClientWorker::post(SessionOperation operation) {
 }
 
 bool ClientWorker::flush(std::chrono::milliseconds timeout) {
-  // The connection handler runs on the thread that would have to do the work.
+  // This thread runs the connection handler, and would have to do the work of the flush.
   if (std::this_thread::get_id() == thread_.get_id()) return false;
   const TimePoint deadline =
       std::chrono::steady_clock::now() + std::min<std::chrono::milliseconds>(timeout, kLongestWait);
@@ -136,7 +139,8 @@ bool ClientWorker::flush(std::chrono::milliseconds timeout) {
   {
     const MutexLock lock(mutex_);
     const std::uint64_t position = ring_.tail();
-    // Flushes with nothing between them share a ticket. Otherwise they could fill the lane.
+    // Flushes share a ticket if nothing was handed over between them. Otherwise they could fill the
+    // lane.
     const bool shares = !lane_.empty() && lane_.back().position == position &&
                         std::holds_alternative<FlushTicket>(lane_.back().step);
     if (!shares) {
@@ -175,7 +179,7 @@ void ClientWorker::help(FlushTicket ticket, TimePoint deadline) {
     std::array<pollfd, 2> polled{
         {{stream_.fd(), static_cast<short>(events), 0}, {wakeUp_.get(), POLLIN, 0}}};
     pollUntil(polled, end);
-    // The worker is wanted for something else, and waits for its turn.
+    // Another thread has woken the worker, which now waits for its turn.
     if (polled[1].revents != 0) return;
     if (polled[0].revents != 0 && !receive()) return;
   }
@@ -203,7 +207,7 @@ Counters ClientWorker::counters() const {
   counters.refused = refused_.load(std::memory_order_acquire) + withoutForm;
   counters.lost = lost_.load(std::memory_order_acquire);
   counters.reconnects = reconnects_.load(std::memory_order_relaxed);
-  // Read last. Otherwise more messages could seem settled than accepted.
+  // Read last. Otherwise the other counters together could exceed the accepted messages.
   counters.accepted = ring_.tail() + withoutForm;
   counters.pending = counters.accepted - counters.acknowledged - counters.refused - counters.lost;
   return counters;
@@ -239,9 +243,10 @@ bool ClientWorker::isEnding() {
 
 bool ClientWorker::mayFallAsleep() {
   nap_ = {};
-  if (!isWindowOpen()) return true;  // the socket or the clock wakes, not a producer
+  if (!isWindowOpen()) return true;  // the socket or the deadline ends the sleep, not a producer
   nap_ = napLength();
-  // Announce a sleep before the last look: a producer sees the one, or this thread its message.
+  // Announce the sleep before the last look at the ring. A producer then sees the announcement, or
+  // this thread sees the producer's message.
   if (nap_.count() == 0) asleep_.store(true, std::memory_order_seq_cst);
   const bool hasWork =
       ring_.isReady() || lanePosition_.load(std::memory_order_acquire) <= ring_.head();
@@ -271,8 +276,8 @@ void ClientWorker::sleepUntilSomethingHappens() {
   // poll() ignores negative descriptors.
   std::array<pollfd, 3> polled{{{wakeUp_.get(), POLLIN, 0}, {watch_.fd(), POLLIN, 0}, {-1, 0, 0}}};
   if (stream_.isOpen()) {
-    // Without an open call only the end of the connection matters, which poll() reports anyway. The
-    // answer to a flush that helps then wakes the thread of the flush alone.
+    // Without an open call, only the end of the connection matters, and poll() always reports that.
+    // If a flush does the work meanwhile, the answer then wakes only the thread of the flush.
     const bool expects = state_ == State::kConnecting || unanswered_ > 0;
     const int events = (expects ? POLLIN : 0) | (stream_.hasOutput() ? POLLOUT : 0);
     polled[2] = {stream_.fd(), static_cast<short>(events), 0};
@@ -310,8 +315,8 @@ void ClientWorker::giveUpWaitingIfOverflowed() {
     lost_.fetch_add(1, std::memory_order_release);
   }
   ring_.release();
-  // The lost operations may have changed any session. Connecting again makes the sessions as they
-  // are wanted now.
+  // The lost operations may have changed any session. Connecting again makes the sessions in their
+  // latest state.
   if (state_ != State::kAbsent) loseConnection();
 }
 

@@ -44,18 +44,20 @@ namespace halvox::client {
 // the service does not answer, the worker takes nothing from the lanes, and they fill up to their
 // bounds.
 //
-// How the worker learns of a message. For 50 milliseconds after a message it looks into the ring
-// again and again, after naps of a few milliseconds: a nap gathers messages for one write, and
-// send() makes no system call. Then it sleeps, so that an idle program has no wake-ups, and the
-// next send() wakes it by one system call. With Options::isRealTime it naps as long as a session
-// runs, for 10 milliseconds at most.
+// For 50 milliseconds after a message, the worker looks into the ring again and again, after naps
+// of a few milliseconds. Messages gather during a nap and leave in one write, and send() makes no
+// system call. Then the worker sleeps, because an idle program must have no wake-ups, and the next
+// send() wakes it by one system call. With Options::isRealTime it does not sleep while a session
+// runs: it takes naps of at most 10 milliseconds.
 //
-// A flush that finds the worker asleep does its work on its own thread, for two milliseconds at
-// most: two changes of threads cost more than the request. `turn_` says whose turn it is. What can
-// end the connection, and the connection handler, are left to the worker's thread.
+// If the worker is asleep, the thread that calls flush() does the worker's work, for at most two
+// milliseconds: two switches of threads cost more than the request. Only the thread that holds
+// `turn_` does that work. Only the worker's thread ends the connection and calls the connection
+// handler.
 //
-// If the lane overflows (kMaxWaitingOperations) while there is no service, the worker discards it
-// with the waiting messages, which count as lost. It then makes the sessions in their latest state.
+// If the lane overflows (kMaxWaitingOperations) while there is no service, the worker discards its
+// content and the waiting messages, which count as lost. After the next connection, it makes the
+// sessions in their latest state.
 class ClientWorker {
  public:
   explicit ClientWorker(Options options);
@@ -69,7 +71,7 @@ class ClientWorker {
   void post(SessionOperation operation);
   bool flush(std::chrono::milliseconds timeout);
   void setConnectionHandler(std::function<void(bool)> handler);
-  // Relaxed: the answer may be outdated when the caller gets it anyway.
+  // Relaxed: the answer may already be outdated when the caller gets it.
   [[nodiscard]] bool isConnected() const { return connected_.load(std::memory_order_relaxed); }
   [[nodiscard]] std::string socketPath() const;
   [[nodiscard]] Counters counters() const;
@@ -103,7 +105,7 @@ class ClientWorker {
   [[nodiscard]] std::chrono::milliseconds napLength() const;
   void sleepUntilSomethingHappens() HALVOX_REQUIRES(turn_);
   [[nodiscard]] TimePoint nextDeadline() const;
-  // On the thread of a flush.
+  // Runs on the thread that calls flush().
   void help(FlushTicket ticket, TimePoint deadline);
   [[nodiscard]] bool isFlushDone(FlushTicket ticket);
 
@@ -119,7 +121,7 @@ class ClientWorker {
   void notifyConnection(bool connected);
   void notifyNewHandler();
 
-  // What goes out.
+  // Sending.
   [[nodiscard]] bool isWindowOpen() const { return state_ == State::kReady && windowIsOpen_; }
   void updateWindow();
   void sendAll();
@@ -132,13 +134,13 @@ class ClientWorker {
   void numberWithoutAnswer(char* frame);
   void giveUpWaitingIfOverflowed();
 
-  // What comes back.
+  // Receiving.
   bool takeAnswers();
   void onAnswer(const Answer& answer);
   void finishFlushes();
 
   const Options options_;
-  const std::vector<std::string> places_;  // where the service may be, in the order of trying
+  const std::vector<std::string> places_;  // where the service may be, in the order of the attempts
   FrameRing ring_;
   const pid_t process_;
   platform::linux_::UniqueFd wakeUp_;
@@ -146,7 +148,7 @@ class ClientWorker {
   std::atomic<bool> closing_{false};
   std::atomic<bool> connected_{false};
   std::atomic<std::uint64_t> dropped_{0};
-  std::atomic<std::uint64_t> withoutForm_{0};  // accepted and refused without a place in the ring
+  std::atomic<std::uint64_t> withoutForm_{0};  // accepted and refused without entering the ring
   // Written only by the worker. counters() reads them before the ring's tail(), so that their sum
   // is never larger than the accepted messages.
   std::atomic<std::uint64_t> acknowledged_{0};
@@ -154,7 +156,7 @@ class ClientWorker {
   std::atomic<std::uint64_t> lost_{0};
   std::atomic<std::uint64_t> reconnects_{0};
   // The position of the first entry of the lane. Written under the lock. A thread publishes a
-  // message after its earlier operations, so the worker sees these first.
+  // message after its earlier operations, and the worker therefore sees the operations first.
   std::atomic<std::uint64_t> lanePosition_{UINT64_MAX};
 
   mutable platform::linux_::Mutex mutex_;
@@ -167,29 +169,30 @@ class ClientWorker {
   FlushTicket flushAsked_ HALVOX_GUARDED_BY(mutex_) = 0;
   FlushTicket flushDone_ HALVOX_GUARDED_BY(mutex_) = 0;
   bool endNow_ HALVOX_GUARDED_BY(mutex_) = false;
-  std::string shownPlace_ HALVOX_GUARDED_BY(mutex_);  // of the present or last connection
+  std::string shownPlace_ HALVOX_GUARDED_BY(mutex_);  // of the current or last connection
 
-  // Held by the thread that does the worker's work: nearly always the worker itself, except in its
-  // sleep. Taken before `mutex_`.
+  // Held by the thread that does the worker's work. The worker itself holds it, except while it
+  // sleeps. Taken before `mutex_`.
   platform::linux_::Mutex turn_;
-  // The following belong to whose turn it is.
+  // The following members belong to the thread that holds `turn_`.
   SocketWatch watch_;
   State state_ = State::kAbsent;
   TimePoint retryAt_{};
   TimePoint handshakeEnds_{};
-  std::string place_;           // of the present or last connection
-  TimePoint samePlaceUntil_{};  // until then no other is tried
+  std::string place_;           // of the current or last connection
+  TimePoint samePlaceUntil_{};  // until then no other place is tried
   std::chrono::milliseconds pause_;
   bool everConnected_ = false;
   SessionTable made_;                      // after all operations that were sent
-  std::deque<SessionOperation> remaking_;  // before anything else of the lanes
+  std::deque<SessionOperation> remaking_;  // to be sent before anything from the lanes
   std::deque<FlushTicket> interruptedFlushes_;
-  TimePoint lastMessage_{};           // when the last one was taken out of the ring
-  std::chrono::milliseconds nap_{0};  // of the coming sleep; 0: none
+  TimePoint lastMessage_{};           // when the worker last took one out of the ring
+  std::chrono::milliseconds nap_{0};  // the next nap; 0: sleep until woken
   bool readable_ = false;             // the socket may have bytes to read, or have been closed
   bool windowIsOpen_ = true;
   std::uint32_t lastSerial_ = 0;
-  // Calls with consecutive serials up to `lastSerial_`, but without the frames that get no answer.
+  // The sent calls, with consecutive serials up to `lastSerial_`. Does not have the oldest ones
+  // once they are answered.
   std::deque<OpenCall> open_;
   std::size_t unanswered_ = 0;
   std::size_t openBytes_ = 0;

@@ -16,8 +16,8 @@ constexpr std::size_t kMaxOpenBytes = std::size_t{4} << 20U;
 // A full window opens again when half of it is answered: fewer and larger writes.
 constexpr std::size_t kReopenAtCalls = kMaxOpenCalls / 2;
 constexpr std::size_t kReopenAtBytes = kMaxOpenBytes / 2;
-// Calls that are tracked for the sake of an older one without an answer. A service that leaves a
-// call unanswered for so long does not work.
+// The most calls to track after one that has no answer. A service that leaves a call unanswered for
+// so long is taken to be broken.
 constexpr std::size_t kMostTrackedCalls = std::size_t{1} << 16U;
 // How many messages are sent before their room is given back to the producers.
 constexpr int kReleaseAfter = 64;
@@ -25,7 +25,7 @@ constexpr int kReleaseAfter = 64;
 }  // namespace
 
 void ClientWorker::tryConnect() {
-  // Watch before the attempt: a service that appears after it is then noticed.
+  // Watch first: a service that appears after the attempt is then noticed.
   watch_.begin();
   auto connected = connectToService(placesToTry());
   if (auto* made = std::get_if<ConnectedStream>(&connected)) {
@@ -190,7 +190,8 @@ void ClientWorker::sendFromLane() {
     return;
   }
   const auto& operation = std::get<SessionOperation>(entry.step);
-  // Note it before sending: if the connection ends here, it is made again with the rest.
+  // Note the operation before sending it. If the connection ends here, the operation is then made
+  // again with the others.
   made_.apply(operation);
   sendOperation(operation);
 }
@@ -201,8 +202,8 @@ void ClientWorker::sendOperation(const SessionOperation& operation) {
   auto* frame = std::get_if<std::string>(&request);
   if (frame == nullptr) return;
   if (std::holds_alternative<StartSession>(operation.step)) {
-    // The service answers a start at the stop. The client does not wait for that, so it asks for no
-    // answer.
+    // The service answers a start only at the stop. The client does not wait for that and asks for
+    // no answer.
     numberWithoutAnswer(frame->data());
   } else {
     numberCall(frame->data(), {});
@@ -226,7 +227,8 @@ void ClientWorker::sendMessageAtHead() {
 }
 
 void ClientWorker::numberCall(char* frame, const OpenCall& call) {
-  // No call has the number 0. A call that is answered already keeps the numbers consecutive.
+  // No call may have the number 0. In its place, an entry that counts as answered keeps the numbers
+  // consecutive.
   if (++lastSerial_ == 0 && !open_.empty()) open_.push_back({.isAnswered = true});
   if (lastSerial_ == 0) ++lastSerial_;
   setSerial(frame, lastSerial_);
@@ -268,12 +270,12 @@ bool ClientWorker::takeAnswers() {
 void ClientWorker::onAnswer(const Answer& answer) {
   const std::uint32_t first = lastSerial_ - static_cast<std::uint32_t>(open_.size()) + 1;
   const std::uint32_t index = answer.replySerial - first;
-  if (index >= open_.size() || open_[index].isAnswered) return;  // to a call that is not open
+  if (index >= open_.size() || open_[index].isAnswered) return;  // answers no open call
   OpenCall& call = open_[index];
   call.isAnswered = true;
   --unanswered_;
   openBytes_ -= call.bytes;
-  pause_ = options_.reconnectMin;  // the service is well
+  pause_ = options_.reconnectMin;  // the service works
   if (call.kind == OpenCall::Kind::kMessage) {
     (answer.isError ? refused_ : acknowledged_).fetch_add(1, std::memory_order_release);
   }

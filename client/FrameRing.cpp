@@ -14,15 +14,15 @@ namespace {
 // Even an unlimited ring does not need more address space than this.
 constexpr std::size_t kMostBytes = std::size_t{1} << 30U;
 constexpr std::size_t kMostFrames = std::size_t{1} << 24U;
-// Memory that is touched in advance: that of a burst while the client's thread keeps up. A page
-// fault would cost an audio thread more than the whole message.
+// Memory that is touched in advance: as much as a burst needs while the client's thread keeps up. A
+// page fault would cost an audio thread more than the whole message.
 constexpr std::size_t kTouchedBytes = std::size_t{256} * 1024;
 
 constexpr std::uint64_t kChange = std::uint64_t{1} << 32U;
 
 }  // namespace
 
-// Collects the cells of one frame. Those of a frame that is not completed return to the ring.
+// Collects the cells of one frame. Returns them to the ring if the frame is not completed.
 class FrameRing::ChainSource final : public SegmentSource {
  public:
   explicit ChainSource(FrameRing& ring) : ring_(ring) {}
@@ -72,7 +72,8 @@ FrameRing::FrameRing(std::size_t maxFrames, std::size_t maxBytes)
       next_(std::make_unique<std::atomic<CellNumber>[]>(cells_)) {}
 
 EncodeOutcome FrameRing::tryPush(const MessageView& message) {
-  // Tested again at the end. Here it saves the work when the ring stays full.
+  // reservePosition() tests this again. The test here saves encoding the message while the ring is
+  // full.
   if (isFullAt(tail_.load(std::memory_order_relaxed))) return EncodeOutcome::kNoRoom;
   ChainSource cells(*this);
   SegmentWriter writer(cells);
@@ -88,7 +89,7 @@ EncodeOutcome FrameRing::tryPush(const MessageView& message) {
 }
 
 bool FrameRing::isFullAt(std::uint64_t position) const {
-  // A position that is outdated already may be below `released_`.
+  // An outdated position may be below `released_`.
   const std::uint64_t released = released_.load(std::memory_order_acquire);
   return position >= released && position - released >= maxFrames_;
 }
@@ -106,8 +107,8 @@ FrameRing::CellNumber FrameRing::popCell() {
   std::uint64_t top = free_.load(std::memory_order_acquire);
   while (static_cast<std::uint32_t>(top) != 0) {
     const CellNumber first = static_cast<std::uint32_t>(top) - 1;
-    // If another thread takes this cell meanwhile, the number read here is of no use, and the
-    // exchange fails.
+    // If another thread takes this cell meanwhile, the number read here is wrong, and the exchange
+    // fails.
     const CellNumber second = next(first).load(std::memory_order_relaxed);
     const std::uint64_t rest = (top & ~std::uint64_t{UINT32_MAX}) + kChange + (second + 1U);
     if (free_.compare_exchange_weak(top, rest, std::memory_order_acquire)) return first;

@@ -19,17 +19,18 @@ namespace halvox::client {
 //       └──────────────────────────── release(), many at once ─────────────────┘
 //
 // The memory of frames is cells of 1 KiB. A frame takes as many as it needs, and needs no other
-// memory. Freed cells are used again first, so that a client whose thread keeps up touches few of
-// them. Each frame then gets a position, which is the order, and a slot.
+// memory. Freed cells are used again first: a client whose thread keeps up touches only a few of
+// them. Each complete frame gets a position, which sets the order of the frames, and the slot of
+// that position.
 //
 // A producer takes no lock, allocates nothing and makes no system call. It repeats a step only if
-// another thread has made the same step meanwhile, and so cannot be held up by a thread that is
-// interrupted. A producer that is interrupted between its position and its slot delays the
+// another thread has completed the same step meanwhile. A thread that is interrupted therefore
+// cannot hold it up. A producer that is interrupted between its position and its slot delays the
 // consumer, but no other producer.
 //
 // Rejected: a list of dictionaries, encoded by the consumer. The program's next change of a
-// dictionary would then have to copy it, on the audio thread. One ring of bytes: all of it is in
-// memory after the first lap, and 8 MiB for each audio process are too many.
+// dictionary would then have to copy it, on the audio thread. Also rejected: one ring of bytes. All
+// of it would be in memory after the first lap, and 8 MiB for each audio process are too much.
 class FrameRing {
  public:
   // Throws std::bad_alloc.
@@ -37,7 +38,8 @@ class FrameRing {
   FrameRing(const FrameRing&) = delete;
   FrameRing& operator=(const FrameRing&) = delete;
 
-  // Any thread may call. kNoRoom if a bound is reached. Only kDone changes anything.
+  // Any thread may call it. Returns kNoRoom if a bound is reached. Changes nothing unless it
+  // returns kDone.
   EncodeOutcome tryPush(const MessageView& message);
   // The number of frames accepted so far, which is the position of the next one.
   [[nodiscard]] std::uint64_t tail() const { return tail_.load(std::memory_order_seq_cst); }
@@ -60,8 +62,9 @@ class FrameRing {
   static constexpr std::size_t kCellBytes = 1024;
 
   struct Slot {
-    // Position + 1 once the frame is complete. Orders the frame before its consumption, and, being
-    // sequentially consistent, after a consumer's announcement that it goes to sleep.
+    // Position + 1 once the frame is complete. Orders the writing of the frame before its reading.
+    // Sequentially consistent with the consumer's announcement that it goes to sleep: the producer
+    // sees the announcement, or the consumer sees the frame.
     std::atomic<std::uint64_t> ready{0};
     CellNumber firstCell = kNoCell;
     std::uint32_t bytes = 0;

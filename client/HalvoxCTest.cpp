@@ -12,7 +12,7 @@ using platform::Array;
 using platform::Data;
 using platform::Date;
 
-// Runs the program that is written in C against this service; its exit status.
+// Runs the C program against this service and returns its exit status.
 int runCProgram(const std::string& socketPath) {
   auto child =
       platform::linux_::ChildProcess::start({.command = {HALVOX_C_TEST_PROGRAM, socketPath}});

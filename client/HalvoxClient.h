@@ -28,7 +28,7 @@ using ServiceType = std::uint16_t;
 // Why a request has no result.
 struct Failure {
   enum class Kind : std::uint8_t {
-    kNoService,   // nobody serves the socket, or the connection ended before the answer
+    kNoService,   // no service listens, or the connection ended before the answer
     kRefused,     // the service answered with an error
     kTimedOut,    // no answer within the time-out; the request may have been carried out
     kBadRequest,  // the wire cannot hold the request: a text that is not UTF-8, or too large
@@ -38,7 +38,7 @@ struct Failure {
   std::string message;  // one line for a person
 };
 
-// Either a value or a failure, never both. True if there is no failure.
+// Either a value or a failure, never both. Converts to true if there is a value.
 template <typename T>
 struct Result {
   std::optional<T> value;
@@ -47,37 +47,40 @@ struct Result {
 };
 
 struct Options {
-  // The socket of the service. If it is empty, the client tries $HALVOX_SOCKET alone if that is
-  // set; otherwise the user's service, $XDG_RUNTIME_DIR/halvox/reporting.sock, then the system's
-  // service, /run/halvox/reporting.sock. It takes the first place at which a service listens.
+  // The socket of the service. If it is empty and $HALVOX_SOCKET is set, the client tries only that
+  // one. Otherwise it tries the user's service, $XDG_RUNTIME_DIR/halvox/reporting.sock, then the
+  // system's service, /run/halvox/reporting.sock. It takes the first place at which a service
+  // listens.
   std::string socketPath;
-  // Bounds of the messages that wait for the client's thread, in number and in bytes of memory: a
-  // message takes its size on the wire, rounded up to KiB. Beyond either, send() drops and counts
-  // them. At most 16,777,216 messages and 1 GiB.
+  // Bounds of the messages that wait for the client's thread, in number and in bytes of memory. A
+  // message takes its size on the wire, rounded up to a multiple of 1 KiB. When either bound is
+  // reached, send() drops the message and counts it. The bounds themselves are at most 16,777,216
+  // messages and 1 GiB.
   std::size_t maxPendingMessages = 8192;
   std::size_t maxPendingBytes = 8U << 20U;
-  // How long making a connection may take.
+  // The longest time that making a connection may take.
   std::chrono::milliseconds requestTimeout{5000};
   // The first and the longest pause between attempts to connect. Pauses grow from one to the other.
   std::chrono::milliseconds reconnectMin{50};
   std::chrono::milliseconds reconnectMax{2000};
-  // How long a client whose connection ended tries only the same place. A service that is being
-  // restarted must not lose its clients to another one.
+  // After a connection has ended, the client tries only the same place for this long. A service
+  // that is being restarted must not lose its clients to another one.
   std::chrono::milliseconds samePlaceFor{10'000};
   // For programs that send from audio threads. While a session runs, the client's thread then looks
-  // for messages by itself, up to a thousand times a second, but a hundred times if none come, and
-  // no send() has to wake it by a system call.
+  // for messages by itself, and send() never makes a system call to wake it. The thread looks up to
+  // a thousand times a second, and a hundred times a second if no messages come.
   bool isRealTime = false;
 };
 
-// How many messages have had which outcome: accepted = acknowledged + refused + lost + pending.
+// The number of messages for each outcome: accepted = acknowledged + refused + lost + pending.
 struct Counters {
   std::uint64_t accepted = 0;      // send() returned true
   std::uint64_t dropped = 0;       // send() returned false: a bound is reached, or the client ends
   std::uint64_t acknowledged = 0;  // answered by the service without an error
   std::uint64_t refused = 0;       // answered with an error, or not representable on the wire
-  // In flight when a connection ended. The service may have received them, so they are not sent
-  // again. Also messages that waited when 8,192 session operations had piled up without a service.
+  // In flight when a connection ended. The client does not send them again, because the service may
+  // have received them. Also counts the messages that were discarded because 8,192 session
+  // operations had piled up without a service.
   std::uint64_t lost = 0;
   std::uint64_t pending = 0;     // waiting or in flight
   std::uint64_t reconnects = 0;  // connections made after the first one
@@ -90,18 +93,18 @@ struct Counters {
 // new one, connects to it and makes its sessions again: created, typed, configured and, if they
 // were running, started. Messages that are handed over meanwhile wait, up to the bounds.
 //
-// Any thread may call. send() encodes the message on the caller's thread, and keeps nothing of it.
-// It never blocks, takes no lock, allocates nothing and does not wait for the service, so an audio
-// thread may call it. It makes one system call, to wake the client's thread, if no message was sent
-// for 50 ms; with Options::isRealTime it makes none while a session runs.
-// The other operations may wait for a lock for a moment.
-// After fork(), a client works only in the process that made it. In a child flush() returns false
-// at once, and destruction leaves the connection to the parent.
+// Any thread may call these functions. send() encodes the message on the caller's thread, and keeps
+// no reference to it. An audio thread may call it: it never blocks, takes no lock, allocates
+// nothing and does not wait for the service. It makes one system call, to wake the client's thread,
+// if no message was sent for 50 ms; with Options::isRealTime it makes none while a session runs.
+// The other operations may wait for a lock for a moment. After fork(), a client works only in the
+// process that made it. In a child flush() returns false at once, and destruction leaves the
+// connection to the parent.
 //
 // The caller owns the client. Construction does not wait for the service and succeeds without one.
-// It throws std::system_error if there is no thread, and std::bad_alloc if there is no memory.
-// Destruction delivers pending messages for at most one second if the service is there, then ends
-// the thread.
+// It throws std::system_error if the thread cannot be started, and std::bad_alloc if there is not
+// enough memory. Destruction delivers pending messages for at most one second if the service is
+// there, then ends the thread.
 class HalvoxClient {
  public:
   explicit HalvoxClient(Options options = {});
@@ -109,8 +112,8 @@ class HalvoxClient {
   HalvoxClient(const HalvoxClient&) = delete;
   HalvoxClient& operator=(const HalvoxClient&) = delete;
 
-  // The steps of a session's life, in their order. They return at once. The service reports no
-  // error for a session that it does not know, so a step for one has no effect. setConfiguration()
+  // The steps of a session's life, in their order. They return at once. A step for a session that
+  // the service does not know has no effect, and the service reports no error. setConfiguration()
   // merges the dictionary into what the session has.
   void createSession(ReporterID id);
   void setServiceType(ReporterID id, ServiceType type);
@@ -119,19 +122,20 @@ class HalvoxClient {
   void stop(ReporterID id);
   void destroySession(ReporterID id);
 
-  // Hands one message over for a session, which may be another client's. Returns false if the
-  // message was dropped; see counters().
+  // Hands over one message for a session. The session may belong to another client. Returns false
+  // if the message was dropped; see counters().
   bool send(ReporterID id, const Dictionary& message, Category category, EventType type);
-  // The same for several sessions, or without a list for all started sessions of all programs.
+  // The same for several sessions. Without a list, the message is for all started sessions of all
+  // programs.
   bool send(const std::optional<std::vector<ReporterID>>& ids, const Dictionary& message,
             Category category, EventType type);
   bool sendTo(std::span<const ReporterID> ids, const Dictionary& message, Category category,
               EventType type);
 
-  // Blocks until everything handed over before has been answered or lost. If the client's thread is
-  // asleep, the calling thread does the sending and receiving for up to two milliseconds. Returns
-  // false after the time-out, at once on the client's own thread, and when the client is being
-  // destroyed.
+  // Blocks until everything that was handed over before this call has been answered or lost. If the
+  // client's thread is asleep, the calling thread does the sending and receiving for up to two
+  // milliseconds. Returns false after the time-out and when the client is being destroyed. On the
+  // client's own thread, returns false at once.
   bool flush(std::chrono::milliseconds timeout);
   // True while a connection to the service exists. Never blocks.
   [[nodiscard]] bool isConnected() const;
@@ -150,8 +154,8 @@ class HalvoxClient {
   std::unique_ptr<Impl> impl_;
 };
 
-// A connection for tools: each operation sends one request, blocks for the answer at most for the
-// time-out of open(), and returns it. Belongs to one thread. Does not reconnect: after the
+// A connection for tools: each operation sends one request, waits for the answer, at most for the
+// time-out given to open(), and returns it. Belongs to one thread. Does not reconnect: after the
 // connection has ended, every request fails with kNoService. Destruction closes the connection, and
 // the service then ends its sessions.
 //
@@ -169,15 +173,15 @@ class HalvoxConnection {
 
   // The socket of this connection.
   [[nodiscard]] const std::string& socketPath() const;
-  // Sockets that were tried before it, which exist but which nobody serves.
+  // The sockets that were tried before this one. They exist, but no service listens on them.
   [[nodiscard]] std::vector<std::string> unservedSockets() const;
 
   Result<bool> createReportingSession(ReporterID id);
   Result<bool> setServiceType(ServiceType type, ReporterID id);
-  // The service type of a session, in spite of the name; 65535 for an unknown session.
+  // Despite its name, returns the service type of a session; 65535 for an unknown session.
   Result<ServiceType> getServiceNameForReporterID(ReporterID id);
   Result<bool> setConfiguration(const Dictionary& configuration, ReporterID id);
-  // Returns when the service has carried the start out. The answer itself comes at the stop, so
+  // Returns when the service has carried out the start. The answer itself comes at the stop, so
   // this sends a query after the start and waits for the answer to that.
   Result<bool> startReportingSessionForID(ReporterID id);
   // Blocks until the last start of that session is answered, at most for `timeout`.
@@ -191,8 +195,8 @@ class HalvoxConnection {
   Result<Dictionary> reporterIDValid(ReporterID id);
   // The IDs of the sessions of all clients.
   Result<std::vector<ReporterID>> getAllReporters();
-  // Ends the service. It does not answer; true means that the connection ended. Only root and the
-  // user that the service runs as may do this; others are refused.
+  // Ends the service. The service does not answer; true means that the connection ended. Only root
+  // and the user that the service runs as may do this; others are refused.
   Result<bool> killService();
 
  private:

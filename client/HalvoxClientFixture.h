@@ -12,12 +12,12 @@
 
 namespace halvox::client {
 
-// As long as a slow machine may need.
+// Long enough for a slow machine.
 inline constexpr std::chrono::seconds kPatience{20};
 inline constexpr Category kPlayback = 4;
 inline constexpr EventType kStart = 1;
 
-// A service that plays along, in a directory of the test's own.
+// A fixture with a test service in a scratch directory.
 class HalvoxClientFixture : public testing::Test {
  protected:
   HalvoxClientFixture() : socketPath_(scratch_.path("reporting.sock")), service_(socketPath_) {}

@@ -24,7 +24,7 @@ TEST_F(HalvoxClientReconnectTest, MessagesWaitForAServiceThatIsNotThereYet) {
   EXPECT_FALSE(client.isConnected());
   service_.come();
 
-  // Both flushes wait for one and the same answer: nothing came between them.
+  // Both flushes wait for the same answer, because no message came between them.
   EXPECT_TRUE(client.flush(kPatience));
   EXPECT_EQ(service_.members(), "createReportingSession sendMessage reporterIDValid");
 }
@@ -127,7 +127,7 @@ TEST_F(HalvoxClientReconnectTest, TellsItsHandlerOfEveryConnectionMadeAndLost) {
 TEST_F(HalvoxClientReconnectTest, DestructionDoesNotWaitForAServiceThatIsNotThere) {
   service_.vanish();
   // With a service that stalls, each destruction waits for a second. A busy machine may delay one
-  // of them as long, but hardly ten in a row.
+  // of them by as much, but hardly ten in a row.
   std::chrono::steady_clock::duration fastest = 1h;
   for (int attempt = 0; attempt < 10 && fastest >= 900ms; ++attempt) {
     const auto before = std::chrono::steady_clock::now();
@@ -166,7 +166,7 @@ TEST_F(HalvoxClientReconnectTest, SurvivesAServiceThatComesAndGoesUnderLoad) {
   std::jthread sender([&] {
     for (std::int64_t number = 0; !done; ++number) {
       client.send(7, {{"n", number}}, kPlayback, kStart);
-      // A full ring would only test that messages are refused.
+      // With a full ring, the test would only show that messages are refused.
       while (!done && client.counters().pending > 64) std::this_thread::yield();
     }
   });

@@ -123,7 +123,7 @@ TEST_F(HalvoxClientTest, LargeMessagesInBothDirectionsDoNotDeadlock) {
 TEST_F(HalvoxClientTest, DestructionDeliversWhatIsPending) {
   {
     HalvoxClient client(options());
-    // The destruction takes at most a second, which is for the messages and not for the connection.
+    // Destruction waits at most a second for messages. Connecting must not use up a part of it.
     ASSERT_TRUE(client.flush(kPatience));
     for (int number = 0; number < 500; ++number) {
       client.send(7, {{"n", number}}, kPlayback, kStart);
@@ -146,7 +146,8 @@ TEST_F(HalvoxClientTest, DestructionGivesAStalledServiceUpAfterASecond) {
   service_.setStalled(false);
 }
 
-// Nobody reads. Every send must return at once all the same, and all of them must be accounted for.
+// The service does not read. Every send must still return at once, and the counters must account
+// for every message.
 TEST_F(HalvoxClientTest, SendingNeverWaitsForAStalledService) {
   constexpr int kThreads = 8;
   constexpr int kEach = 20'000;

@@ -16,7 +16,7 @@ namespace {
 namespace dbus = platform::linux_::dbus;
 using Deadline = std::chrono::steady_clock::time_point;
 
-// At least one look at the socket.
+// Long enough to look at the socket once.
 constexpr std::chrono::milliseconds kShortestTimeout{1};
 // Larger durations could overflow the clock's time points.
 constexpr std::chrono::milliseconds kLongestTimeout = std::chrono::hours(24 * 365);
@@ -90,8 +90,8 @@ class HalvoxConnection::Impl {
   [[nodiscard]] bool isOpen() const { return connected_.stream.isOpen(); }
   [[nodiscard]] Deadline deadline() const { return std::chrono::steady_clock::now() + timeout_; }
 
-  // Handles what has arrived, or waits for something until the deadline at most. Returns 0 or a
-  // negative errno: -ECONNRESET if the connection has ended, -ETIMEDOUT after the deadline.
+  // Handles what has arrived, or waits for something to arrive, at most until the deadline. Returns
+  // 0 or a negative errno: -ECONNRESET if the connection has ended, -ETIMEDOUT after the deadline.
   int processUntil(Deadline deadline) {
     ServiceStream& stream = connected_.stream;
     if (!stream.isOpen() || !stream.send()) return -ECONNRESET;
@@ -232,8 +232,8 @@ Result<bool> HalvoxConnection::startReportingSessionForID(ReporterID id) {
   HeldReply& reply = impl_->heldReplies()[id];
   reply = {.serial = impl_->post(std::move(std::get<std::string>(request))), .answer = {}};
 
-  // Requests are carried out in order, so this is answered after the start was carried out. The
-  // answer to a refused start has arrived by then.
+  // The service carries out requests in order: it answers this one after it has carried out the
+  // start. If it refuses the start, that answer has arrived by then.
   auto query = impl_->ask(makeRequest("reporterIDValid", id));
   if (!query) return failed<bool>(std::move(*query.failure));
   if (reply.answer && !*reply.answer) return *reply.answer;

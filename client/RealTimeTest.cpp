@@ -1,5 +1,5 @@
-// What an audio thread may rely on: it counts the system calls, allocations and locks of a thread
-// that sends through the shared library as programs use it.
+// Tests what audio threads rely on: counts the system calls, allocations and locks of a thread that
+// sends through the shared library, as a program would.
 
 #include <atomic>
 #include <cerrno>
@@ -24,7 +24,7 @@
 
 namespace {
 
-// Counted on the threads that ask for it only.
+// Counted only on the threads that ask for it.
 thread_local bool counts = false;
 thread_local int allocations = 0;
 thread_local int locks = 0;
@@ -114,12 +114,12 @@ struct Counts {
   int locks = 0;
 };
 
-// Runs work on a thread of its own and counts what it does.
+// Runs `work` on a new thread and counts its system calls, allocations and locks.
 template <typename Work>
 Counts count(const Work& work) {
   Counts result;
   std::thread([&] {
-    // The first allocation of a thread maps memory for it, which is not what is counted here.
+    // The first allocation of a thread maps memory for the thread. Do not count that.
     halvox_dictionary_free(halvox_dictionary_new());
     systemCalls = 0;
     result.trapped = trapSystemCalls();

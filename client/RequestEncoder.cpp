@@ -22,7 +22,8 @@ constexpr std::string_view kInterface = "com.tarno.halvox.HVReportingServiceProt
 
 // ---- Headers
 
-// A header without serial and length of the body: the same bytes for every call of a method.
+// A header without its serial and the length of the body: the same bytes for every call of a
+// method.
 struct Header {
   std::array<char, 192> bytes{};
   std::size_t size = 0;

@@ -11,12 +11,13 @@
 #include "client/SessionTable.h"
 
 // The requests of the service's protocol as frames of the wire. A frame has the serial 0 until
-// setSerial(). Numbers keep their type; a float is a double, an array has variants as elements.
+// setSerial(). Numbers keep their type, except that a float becomes a double. The elements of an
+// array are variants.
 namespace halvox::client {
 
-// A message, as the caller has it. Nothing is owned.
+// Refers to the parts of a message, which the caller owns.
 struct MessageView {
-  // The sessions that it is for; nothing stands for all active ones.
+  // The sessions that it is for; std::nullopt stands for all active ones.
   std::optional<std::span<const ReporterID>> recipients;
   const Dictionary& message;
   Category category = 0;
@@ -26,11 +27,11 @@ struct MessageView {
 enum class EncodeOutcome : std::uint8_t {
   kDone,
   kNoRoom,      // the segments are full
-  kNoWireForm,  // a text is not UTF-8, there is no value, too deep or too long
+  kNoWireForm,  // not UTF-8, an absent value, nested too deep, or too long
 };
 
-// Writes the frame of sendMessage. Allocates nothing. After any outcome but kDone the segments hold
-// nothing of use.
+// Writes the frame of sendMessage. Allocates nothing. Unless it returns kDone, the content of the
+// segments is undefined.
 EncodeOutcome encodeMessage(SegmentWriter& writer, const MessageView& message);
 
 // A frame, or why the wire cannot hold the request.
@@ -41,7 +42,7 @@ Request makeRequest(const char* member, ReporterID id);
 Request makeRequest(const SessionOperation& operation);
 Request makeRequest(const MessageView& message);
 
-// Numbers a complete frame, of which at least the first 12 bytes are at `frame`. Not 0.
+// Sets the serial, which must not be 0, in a frame. At least its first 12 bytes must be at `frame`.
 void setSerial(char* frame, std::uint32_t serial);
 // Asks the service not to answer this frame.
 void setNoReplyExpected(char* frame);

@@ -44,7 +44,7 @@ class RequestEncoderTest : public testing::Test {
   void write(const std::string& bytes) {
     EXPECT_EQ(::write(peer_.get(), bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
   }
-  // What sd-bus makes of a frame.
+  // Returns the message that sd-bus reads from a frame.
   sd_bus_message* read(Request request) {
     auto* frame = std::get_if<std::string>(&request);
     EXPECT_NE(frame, nullptr);
@@ -213,7 +213,7 @@ TEST_F(RequestEncoderTest, NestingPastTheWiresLimitIsRefused) {
   EXPECT_NE(error->find("nested too deep"), std::string::npos);
 }
 
-// A bad byte at every place of texts of every length around the size of a word.
+// Puts a bad byte at every place of texts whose lengths are around the size of a word.
 TEST_F(RequestEncoderTest, FindsNulsAndBytesThatAreNotUtf8AtAnyPlace) {
   for (std::size_t size = 1; size <= 20; ++size) {
     const std::string good(size, 'x');

@@ -35,7 +35,7 @@ bool SegmentWriter::extend() {
 }
 
 Segment HeapSegments::next() {
-  // Each is as large as all before it together, so that a large frame takes few.
+  // Each segment is as large as all earlier ones together: a large frame then takes only a few.
   std::size_t bytes = 0;
   for (const auto& segment : segments_) bytes += segment.size() * sizeof(std::uint64_t);
   bytes = std::max(bytes, kFirstSegmentBytes);

@@ -9,7 +9,7 @@
 
 namespace halvox::client {
 
-// A piece of memory to write into. It begins at a multiple of 8 and its size is one.
+// A piece of memory to write into. Its address and its size are multiples of 8.
 struct Segment {
   char* begin = nullptr;
   char* end = nullptr;
@@ -23,16 +23,16 @@ class SegmentSource {
   SegmentSource(const SegmentSource&) = delete;
   SegmentSource& operator=(const SegmentSource&) = delete;
 
-  // The next piece, or an empty one if there is no more room.
+  // Returns the next piece, or an empty one if no room remains.
   virtual Segment next() = 0;
 };
 
 // Writes a frame of the wire, in the byte order of this machine, into one or several segments. The
-// frame starts with the first segment. Because segments are multiples of 8, no number crosses the
-// border of two segments, and addresses have the alignment of positions in the frame.
+// frame starts with the first segment. Because segments are multiples of 8, no number crosses from
+// one segment into the next, and an address has the same alignment as its position in the frame.
 //
-// Without room the writer does nothing more, and isFull() is true. Belongs to one thread. Does not
-// own `source`, which must outlive it.
+// When no room remains, the writer does nothing more, and isFull() returns true. Belongs to one
+// thread. Does not own `source`, which must outlive it.
 class SegmentWriter {
  public:
   explicit SegmentWriter(SegmentSource& source) : source_(source) { extend(); }
@@ -86,7 +86,7 @@ class SegmentWriter {
   char* end_ = nullptr;
   std::size_t before_ = 0;  // bytes in earlier segments
   bool full_ = false;
-  alignas(8) char spare_[8] = {};  // takes a length that has no room
+  alignas(8) char spare_[8] = {};  // where a length goes for which no room remains
 };
 
 // Segments on the heap, for frames that are made where an allocation does not matter.

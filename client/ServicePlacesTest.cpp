@@ -10,7 +10,7 @@ namespace {
 
 using Places = std::vector<std::string>;
 
-// Without the variables that the places depend on, whatever the tests run in.
+// Unsets the environment variables that the places depend on.
 class ServicePlacesTest : public testing::Test {
  protected:
   ServicePlacesTest() { clear(); }

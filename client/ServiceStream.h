@@ -24,7 +24,7 @@ namespace halvox::client {
 // Once it is ready, the owner appends frames and calls send() to write everything that has gathered
 // in one system call. (Some servers overlook frames that arrive in one piece with the end of the
 // handshake.) receive() reads what has arrived; the owner then takes frames out of input(). Both
-// return false when the connection has ended, from then on always. Belongs to one thread at a time.
+// return false once the connection has ended. Belongs to one thread at a time.
 class ServiceStream {
  public:
   ServiceStream() = default;
@@ -76,7 +76,7 @@ struct ConnectedStream {
 // the search. The failure names the places that were tried.
 std::variant<ConnectedStream, Failure> connectToService(const std::vector<std::string>& places);
 
-// An answer to a call, as far as its header tells.
+// What the header of an answer says.
 struct Answer {
   std::uint32_t replySerial = 0;
   bool isError = false;
@@ -87,12 +87,12 @@ struct Answer {
 struct NextFrame {
   enum class State : std::uint8_t {
     kIncomplete,  // wait for more bytes
-    kAnswer,      // `answer` tells to which call
+    kAnswer,      // `answer` names the call
     kOther,       // a frame that answers nothing: ignore it
-    kBroken,      // not D-Bus: the connection is of no use any more
+    kBroken,      // not D-Bus: the connection cannot be used any more
   };
   State state = State::kIncomplete;
-  std::size_t bytes = 0;  // to consume
+  std::size_t bytes = 0;  // bytes to consume
   Answer answer;
 };
 

@@ -18,7 +18,7 @@ void SessionTable::apply(const SessionOperation& operation) {
   Session& session = found->second;
   std::visit(
       Overloaded{
-          [](const CreateSession&) {},  // has returned above
+          [](const CreateSession&) {},  // handled above
           [&](ServiceType type) { session.type = type; },
           [&](const Dictionary& configuration) { session.configuration.merge(configuration); },
           [&](const StartSession&) { setRunning(session, true); },

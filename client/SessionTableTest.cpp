@@ -7,7 +7,7 @@
 namespace halvox::client {
 namespace {
 
-// The operations in words, to compare them at a glance.
+// Returns the operations as text, which makes a failed comparison easy to read.
 std::string words(const std::vector<SessionOperation>& operations) {
   static constexpr const char* kVerbs[] = {"create", "type", "configure",
                                            "start",  "stop", "destroy"};

@@ -7,10 +7,11 @@
 
 namespace halvox::client {
 
-// Reports when a file appears under the name of one of several sockets, so that the client connects
-// to a new service at once, not only at the next attempt. Watches only between begin() and end(),
-// so that changes in the directories do not wake a connected client. Belongs to one thread. Reports
-// nothing for a directory that does not exist, or without inotify; the client's attempts go on.
+// Reports when a file appears under the name of one of several sockets. The client then connects to
+// a new service at once instead of waiting for its next attempt. Watches only between begin() and
+// end(): changes in the directories must not wake a connected client. Belongs to one thread.
+// Reports nothing for a directory that does not exist, or if inotify is not available; the client
+// then relies on its attempts.
 class SocketWatch {
  public:
   explicit SocketWatch(const std::vector<std::string>& socketPaths);
@@ -27,7 +28,7 @@ class SocketWatch {
   struct Watched {
     std::string directory;
     std::string name;
-    int watch = -1;  // of inotify; negative: none, because the directory does not exist
+    int watch = -1;  // of inotify; negative if the directory is not watched
   };
 
   std::vector<Watched> watched_;

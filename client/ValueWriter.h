@@ -11,12 +11,12 @@
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/value.h"
 
-// How values become the bytes of a request. A header, and inline, because the caller's thread pays
-// for every call: only RequestEncoder.cpp includes it.
+// Encodes values as bytes of a request. The code is inline in a header because the caller's thread
+// pays for every function call. Only RequestEncoder.cpp includes it.
 namespace halvox::client {
 
-// True for ASCII without NUL, which nearly all texts are. Spares them the call of the full test and
-// its end byte by byte.
+// True for ASCII without NUL, which nearly all texts are. Saves them the call of the full test,
+// which checks the last bytes one by one.
 inline bool isPlainText(std::string_view text) {
   constexpr std::uint64_t kEachByte = 0x0101010101010101;
   constexpr std::uint64_t kEachHighBit = 0x8080808080808080;
@@ -40,7 +40,8 @@ inline bool isWireText(std::string_view text) {
   return isPlainText(text) || platform::linux_::isUtf8WithoutNul(text);
 }
 
-// Copies a text whose length is seldom a constant and mostly small. memcpy() would be a call.
+// Copies a text. Its length is mostly small but seldom a constant, and memcpy() would then be a
+// function call.
 inline char* copyText(char* to, std::string_view text) {
   const std::size_t size = text.size();
   if (size >= 8 && size <= 32) {
@@ -58,7 +59,8 @@ inline char* copyText(char* to, std::string_view text) {
   return to + size + 1;
 }
 
-// Appends zeros up to a multiple of 8 or 4. Writes up to 8 bytes beyond.
+// Appends zeros up to a multiple of 8 or 4. Always writes 8 bytes, of which the last may lie beyond
+// the result.
 inline char* padded(char* at, std::size_t alignment) {
   std::memset(at, 0, 8);
   return at + ((0 - reinterpret_cast<std::uintptr_t>(at)) & (alignment - 1));
@@ -70,8 +72,8 @@ inline char* put(char* at, Number number) {
   return at + sizeof number;
 }
 
-// Appends the signature of one basic type. Writes a zero beyond: one store of four bytes, because
-// three would go through the stack.
+// Appends the signature of one basic type. Also writes a zero after it: four bytes are one store,
+// and three would go through the stack.
 inline char* putSignature(char* at, char type) {
   const char bytes[4] = {1, type, 0, 0};
   std::memcpy(at, bytes, sizeof bytes);
@@ -109,13 +111,13 @@ inline char* putNumber(char* at, const Value& value) {
   return at;
 }
 
-// Signature, padding and number need at most this much, padded() included.
+// Signature, padding and number need at most this much, including what padded() writes.
 constexpr std::size_t kNumberRoom = 24;
 // The same for an entry besides its texts: padding, two lengths, two NULs and a signature.
 constexpr std::size_t kEntryRoom = 16 + kNumberRoom;
 
-// Appends values and remembers why one cannot be sent. If there is a `path`, it gets the place of
-// that value in the message.
+// Appends values and remembers why one cannot be sent. If `path` is not null, stores the place of
+// that value in the message there.
 class ValueWriter {
  public:
   explicit ValueWriter(SegmentWriter& writer, std::string* path = nullptr)
@@ -159,7 +161,7 @@ class ValueWriter {
     SegmentWriter::replaceLength(length, bytes);
     return leave();
   }
-  // Without room there is no use in going on, and a large message would take long.
+  // When no room remains, writing the rest of a large message would only take time.
   [[nodiscard]] bool mayGoOn() const { return !writer_.isFull(); }
 
   void notePlace(std::string_view key) {
@@ -175,7 +177,8 @@ class ValueWriter {
 
   bool appendEntry(std::string_view key, const Value& value) {
     if (!isWireText(key)) return fail("the key is not UTF-8 without NUL");
-    // Nearly all entries are numbers and short texts, and do not cross the border of a segment.
+    // The fast path: nearly all values are numbers and short texts, and their entries fit into the
+    // current segment.
     const std::string_view text = value.string();
     char* at = writer_.reserve(key.size() + text.size() + kEntryRoom);
     if (at != nullptr && depth_ < platform::linux_::dbus::kMaxNesting) {
@@ -237,7 +240,8 @@ class ValueWriter {
 
   bool appendNumber(const Value& value) {
     if (!enter()) return false;
-    // Made at a multiple of 8 first: its padding depends on where it begins.
+    // The padding depends on where the value begins. Encode it here at the same offset from a
+    // multiple of 8.
     alignas(8) std::array<char, 8 + kNumberRoom> made{};
     const std::size_t misaligned = writer_.position() % 8;
     const char* const end = putNumber(made.data() + misaligned, value);
@@ -291,7 +295,7 @@ class ValueWriter {
   SegmentWriter& writer_;
   unsigned depth_ = 0;
   const char* reason_ = "";
-  std::string* path_;  // of the caller; null if nobody asks for it
+  std::string* path_;  // owned by the caller; null if not wanted
 };
 
 }  // namespace halvox::client

@@ -14,8 +14,8 @@
 #include "client/Vocabulary.h"
 #include "platform/linux/base/Utf8.h"
 
-// The handles are plain structs around the C++ objects. No exception may leave this file. The calls
-// below throw only if memory or threads are exhausted.
+// The handles are plain structs around the C++ objects. No exception may leave this file. The
+// functions that are called here throw only if memory or threads are exhausted.
 
 namespace client = halvox::client;
 using halvox::platform::Data;
@@ -54,7 +54,7 @@ halvox_result done(Work&& work) noexcept {
   });
 }
 
-// Returns nothing for a text that a message cannot hold.
+// Returns std::nullopt for a text that a message cannot hold.
 std::optional<Value> textValue(const char* text) {
   if (text == nullptr || !halvox::platform::linux_::isUtf8WithoutNul(text)) return std::nullopt;
   return Value(text);

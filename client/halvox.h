@@ -233,7 +233,7 @@ typedef struct halvox_options {
   uint64_t real_time;            /* not 0: for audio threads, see halvox_client_send() */
 } halvox_options;
 
-/* How many messages have had which outcome: accepted = acknowledged + refused + lost + pending. */
+/* The number of messages for each outcome: accepted = acknowledged + refused + lost + pending. */
 typedef struct halvox_counters {
   size_t size;           /* set it to sizeof(halvox_counters) before the call */
   uint64_t accepted;     /* a send function returned HALVOX_OK */
@@ -258,15 +258,16 @@ typedef void (*halvox_connection_handler)(bool connected, void* user_data);
  *   3. the system's service, /run/halvox/reporting.sock, if it exists;
  *   4. otherwise the first of these places that is defined.
  *
- * A client itself also goes on to the next place if nobody serves a socket, and looks again at each
- * attempt. After its connection ended, it tries only the same place for 10 seconds: a service that
- * is being restarted must not lose its clients to another one. Fills the buffer and returns the
- * length as halvox_category_name() does. */
+ * A client also tries the next place if no service listens on a socket, and searches again at each
+ * attempt. After its connection has ended, it tries only the same place for 10 seconds: a service
+ * that is being restarted must not lose its clients to another one. Fills the buffer and returns
+ * the length as halvox_category_name() does. */
 HALVOX_API size_t halvox_default_socket_path(char* buffer, size_t size);
 
 /* Starts a client with its thread. Does not wait for the service, and succeeds without one.
  * `options` may be NULL for all defaults. The caller owns the client and releases it with
- * halvox_client_free(). Returns NULL if there is no memory or no thread. */
+ * halvox_client_free(). Returns NULL if there is not enough memory or the thread cannot be started.
+ * */
 HALVOX_API halvox_client* halvox_client_new(const halvox_options* options);
 /* Delivers pending messages for at most one second if the service is there, then ends the client,
  * its thread and its sessions. Blocks meanwhile. No call on this client may run or follow. */
@@ -275,14 +276,15 @@ HALVOX_API void halvox_client_free(halvox_client* client);
 /* The steps of a session's life. `id` is a reporter ID, a number that the program chooses; 0 means
  * no session. The calls hand the step to the client's thread and return at once. Steps and messages
  * of one thread are carried out in the order of the calls. HALVOX_OK means that the step was handed
- * over. The service reports no error for a session that it does not know, so a step for one has no
- * effect. These functions may wait for a lock for a moment and may allocate. */
-/* Makes a session, in place of an older one of this client with the same ID. */
+ * over. A step for a session that the service does not know has no effect, and the service reports
+ * no error. These functions may wait for a lock for a moment and may allocate. */
+/* Makes a session. It replaces an older one of this client with the same ID. */
 HALVOX_API halvox_result halvox_client_create_session(halvox_client* client, int64_t id);
 /* Says what kind of audio the session is for: a HALVOX_SERVICE_... number. */
 HALVOX_API halvox_result halvox_client_set_service_type(halvox_client* client, int64_t id,
                                                         uint16_t service_type);
-/* Merges a dictionary into the session's configuration: its keys replace equal ones. */
+/* Merges a dictionary into the session's configuration: a new value replaces the old one of the
+ * same key. */
 HALVOX_API halvox_result halvox_client_set_configuration(halvox_client* client, int64_t id,
                                                          const halvox_dictionary* configuration);
 /* Starts reporting for the session. The service answers a start only at the stop; the client does
@@ -293,13 +295,13 @@ HALVOX_API halvox_result halvox_client_stop(halvox_client* client, int64_t id);
 /* Removes the session, and stops it first if it runs. */
 HALVOX_API halvox_result halvox_client_destroy_session(halvox_client* client, int64_t id);
 
-/* Hand one message to the client's thread, for one session, which may be another client's. Returns
- * HALVOX_OK, or HALVOX_DROPPED if a bound of halvox_options is reached or the client is ending;
- * halvox_client_counters() counts both. `category` is a HALVOX_CATEGORY_... number, optionally with
- * a domain, `type` is a HALVOX_EVENT_... number.
+/* Hand one message for one session to the client's thread. The session may belong to another
+ * client. Returns HALVOX_OK, or HALVOX_DROPPED if a bound of halvox_options is reached or the
+ * client is ending; halvox_client_counters() counts both. `category` is a HALVOX_CATEGORY_...
+ * number, optionally with a domain, `type` is a HALVOX_EVENT_... number.
  *
- * An audio thread may call the send functions: they encode the message, keep nothing of it, and
- * never block, allocate, take a lock or wait for the service. If no message was sent for 50 ms,
+ * An audio thread may call the send functions: they encode the message, keep no reference to it,
+ * and never block, allocate, take a lock or wait for the service. If no message was sent for 50 ms,
  * they make one system call, to wake the client's thread. With the option `real_time` they make
  * none while a session runs: the thread then looks for messages by itself, at least a hundred times
  * a second. */
@@ -316,9 +318,9 @@ HALVOX_API halvox_result halvox_client_send_to_all(halvox_client* client,
                                                    const halvox_dictionary* message,
                                                    uint32_t category, uint16_t type);
 
-/* Blocks until everything handed over before has been answered or lost. Returns HALVOX_TIMED_OUT
- * after `timeout_ms`, and at once if it is called from the connection handler, whose thread would
- * have to do the work. */
+/* Blocks until everything that was handed over before this call has been answered or lost. Returns
+ * HALVOX_TIMED_OUT after `timeout_ms`, and at once if it is called from the connection handler,
+ * whose thread would have to do the work. */
 HALVOX_API halvox_result halvox_client_flush(halvox_client* client, uint32_t timeout_ms);
 /* Returns true while a connection to the service exists. Never blocks. */
 HALVOX_API bool halvox_client_is_connected(const halvox_client* client);
@@ -328,8 +330,8 @@ HALVOX_API halvox_result halvox_client_counters(const halvox_client* client,
                                                 halvox_counters* counters);
 /* Sets the function to call when the connection is made or lost. If there is a connection already,
  * the handler is called soon with true. Replaces an earlier handler; NULL removes it. A call that
- * is running when the handler is replaced may end after this function has returned, so `user_data`
- * must live on until then, at the latest until halvox_client_free() returns. */
+ * is running when the handler is replaced may end after this function has returned. `user_data`
+ * must exist until that call ends, at the latest until halvox_client_free() returns. */
 HALVOX_API halvox_result halvox_client_set_connection_handler(halvox_client* client,
                                                               halvox_connection_handler handler,
                                                               void* user_data);

@@ -2,7 +2,7 @@
 
 #ifdef HALVOX_TRACE_BY_LTTNG
 
-/* The definition that the service's own provider has, so that both emit the same event. */
+/* Uses the definition of the service's own provider: both must emit the same event. */
 #define LTTNG_UST_TRACEPOINT_CREATE_PROBES
 #define LTTNG_UST_TRACEPOINT_DEFINE
 #include "platform/linux/kdebug/lttng/kdebug_provider.h"

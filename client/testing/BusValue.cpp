@@ -102,7 +102,7 @@ std::optional<Value> readNumber(sd_bus_message* message, char type) {
       return readBasic<std::uint64_t>(message, type);
     case 'd':
       return readBasic<double>(message, type);
-    default:  // what a peer may send is not an enumeration of ours
+    default:  // a peer may send any character
       return std::nullopt;
   }
 }

@@ -6,8 +6,8 @@
 
 struct sd_bus_message;
 
-// What sd-bus reads out of messages, as a check that shares no code with the library. Arrays of any
-// type are read, and variants are unwrapped.
+// Reads messages with sd-bus: a check that shares no code with the library. Reads arrays of any
+// type, and unwraps variants.
 namespace halvox::client {
 
 // Reads the next complete value of the message, of any type. Returns nothing at the end of the

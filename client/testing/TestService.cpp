@@ -166,7 +166,7 @@ void TestService::accept() {
 }
 
 void TestService::serve(Connection& connection) {
-  // A failure leaves the bus closed, and run() then drops it.
+  // After a failure, run() drops the closed bus.
   int result = 0;
   do {
     result = sd_bus_process(connection.bus.get(), nullptr);

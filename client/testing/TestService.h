@@ -26,12 +26,12 @@ struct RecordedCall {
   std::vector<Value> arguments;
 };
 
-// Plays the reporting service for tests of clients: answers as the protocol says, notes every
-// request, and can be made to stall, to refuse, to vanish and to come back.
-// One thread of its own serves all connections. Any thread may call the public operations.
+// Stands in for the reporting service in tests of clients. It answers as the protocol says and
+// records every request. A test can make it stall, refuse requests, vanish and come back. One
+// thread of its own serves all connections. Any thread may call the public operations.
 class TestService {
  public:
-  // Listens at that path at once.
+  // Listens on that socket at once.
   explicit TestService(std::string socketPath);
   ~TestService();
   TestService(const TestService&) = delete;
@@ -42,12 +42,12 @@ class TestService {
   // Ends every connection and removes the socket; come() listens again.
   void vanish();
   void come();
-  // From now on requests of that member are answered with an error. The empty name ends that.
+  // Answers all later requests of that member with an error. An empty name ends this.
   void refuse(std::string member, std::string errorName = "com.tarno.audio.reporting.Code1");
 
   [[nodiscard]] std::vector<RecordedCall> calls();
   [[nodiscard]] std::size_t count(std::string_view member);
-  // Waits until as many requests of that member have come; false when they do not come in time.
+  // Waits for `count` requests of that member. Returns false if they do not arrive in time.
   [[nodiscard]] bool waitForCalls(std::string_view member, std::size_t count);
   // The members of all requests in their order, separated by blanks.
   [[nodiscard]] std::string members();
@@ -69,7 +69,7 @@ class TestService {
   };
 
   void run();
-  void perform(Job job);  // on the service's thread, and waits for it
+  void perform(Job job);  // runs it on the service's thread and waits for its end
   void listen();
   void leave();
   void accept();
@@ -89,7 +89,7 @@ class TestService {
   std::list<Job> jobs_ HALVOX_GUARDED_BY(mutex_);
   std::size_t jobsDone_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::size_t jobsAsked_ HALVOX_GUARDED_BY(mutex_) = 0;
-  // The thread's own.
+  // Used only by the service's thread.
   bool stalled_ = false;
   bool leaving_ = false;
   bool ended_ = false;
@@ -100,7 +100,7 @@ class TestService {
   std::jthread thread_;
 };
 
-// What tests of clients use besides.
+// For the tests of clients, which use these without naming the namespace.
 using platform::linux_::eventually;
 using platform::linux_::ScratchDirectory;
 

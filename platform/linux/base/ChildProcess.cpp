@@ -21,8 +21,8 @@ namespace {
 
 using std::chrono::milliseconds;
 
-// What a child's descriptors are made of. Copies those of ours that have the number of a child's:
-// setting up one descriptor would otherwise replace the source of another.
+// The descriptors of ours that a child's descriptors are made from. Copies each one whose number
+// the child also uses: setting up one descriptor would otherwise replace the source of another.
 class DescriptorSources {
  public:
   explicit DescriptorSources(const std::vector<ChildProgram::Descriptor>& descriptors) {
@@ -37,7 +37,8 @@ class DescriptorSources {
 
  private:
   int sourceOf(int ours) {
-    // A number above all that the child uses: setting those up cannot replace this descriptor.
+    // The copy gets a number above all those that the child uses. Setting those up then cannot
+    // replace the copy.
     if (ours == ChildProgram::Descriptor::kNull || ours > largest_) return ours;
     UniqueFd& copy = copies_.emplace_back(::fcntl(ours, F_DUPFD_CLOEXEC, largest_ + 1));
     if (!copy) error_ = errno;
@@ -62,7 +63,7 @@ class SpawnActions {
       }
     }
     if (program.otherDescriptors == ChildProgram::OtherDescriptors::kClosed) {
-      // The last action: the sources of the child's descriptors are above that number too.
+      // This action comes last, because it also closes the sources of the child's descriptors.
       ::posix_spawn_file_actions_addclosefrom_np(&actions_, sources.largest() + 1);
     }
   }
@@ -112,7 +113,8 @@ class SpawnAttributes {
   posix_spawnattr_t attributes_{};
 };
 
-// The null-terminated array of pointers into texts that posix_spawn() takes, and does not change.
+// Returns the null-terminated array of pointers into `texts` that posix_spawn() takes.
+// posix_spawn() does not change the texts.
 std::vector<char*> pointersTo(const std::vector<std::string>& texts) {
   std::vector<char*> pointers;
   pointers.reserve(texts.size() + 1);
@@ -127,7 +129,7 @@ UniqueFd openProcess(pid_t pid) {
   return UniqueFd(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
 }
 
-// For poll(): rounded up, and at most a day, so that it fits.
+// For poll(): rounded up, and at most a day, because poll() takes an int.
 int millisecondsUntil(ChildProcess::Clock::time_point deadline) {
   const auto now = ChildProcess::Clock::now();
   if (deadline <= now) return 0;
@@ -186,12 +188,12 @@ ChildProcess& ChildProcess::operator=(ChildProcess&& other) noexcept {
 }
 
 void ChildProcess::signal(int number) const {
-  // Only a child that has not been reaped: afterwards its ID may be that of another process.
+  // Signal only a child that has not been reaped: afterwards another process may have its ID.
   if (pid_ != 0) ::kill(pid_, number);
 }
 
 void ChildProcess::signalGroup(int number) const {
-  // A child in our group is signalled alone. The group includes this process.
+  // A child in our group is signalled alone, because the group includes this process.
   if (pid_ != 0) ::kill(group_ == ChildProgram::Group::kOurs ? pid_ : -pid_, number);
 }
 
@@ -203,7 +205,8 @@ bool ChildProcess::reap(int options) {
     reaped = ::waitpid(pid_, &status, options);
   } while (reaped < 0 && errno == EINTR);
   if (reaped == 0) return false;
-  // It fails only if somebody else has waited for the child, whose end is then unknown.
+  // waitpid() fails only if other code has waited for the child. How the child ended is then
+  // unknown.
   if (reaped == pid_) {
     end_ = WIFSIGNALED(status) ? ChildEnd{.status = -1, .signal = WTERMSIG(status)}
                                : ChildEnd{.status = WEXITSTATUS(status), .signal = 0};
@@ -214,7 +217,7 @@ bool ChildProcess::reap(int options) {
 }
 
 std::optional<ChildEnd> ChildProcess::waitUntil(Clock::time_point deadline) {
-  constexpr int kLookEvery = 10;  // milliseconds, at a child that has no descriptor
+  constexpr int kLookEvery = 10;  // milliseconds, if the child has no descriptor
   while (!reap(WNOHANG)) {
     const int left = millisecondsUntil(deadline);
     if (left == 0) return std::nullopt;

@@ -21,7 +21,7 @@ struct ChildProgram {
     int number;
     int ours = kNull;
   };
-  // Which descriptors the child has besides those in `descriptors`.
+  // Which descriptors the child has in addition to those in `descriptors`.
   enum class OtherDescriptors : std::uint8_t {
     kWithoutCloseOnExec,  // those without the close-on-exec flag, including the standard streams
     kClosed               // none above the largest number in `descriptors`
@@ -57,9 +57,8 @@ struct ChildEnd {
 //
 //   start() --> running --waitUntil(), wait(), kill()--> ended
 //
-// The destructor kills a child that runs. A signal goes to the number of the child, which is its
-// own until it is reaped; afterwards this object sends none, since another process may have the
-// number. Movable; one thread at a time may use it.
+// The destructor kills a running child. This object sends no signal to a child that was reaped,
+// because another process may then have its process ID. Movable; one thread at a time may use it.
 class ChildProcess {
  public:
   using Clock = std::chrono::steady_clock;
@@ -74,12 +73,13 @@ class ChildProcess {
 
   // 0 once the child is reaped, or was detached.
   [[nodiscard]] pid_t pid() const { return pid_; }
-  // Readable (poll) when the child has ended, so that it can be waited for together with others.
-  // Owned by this object; -1 if the process had no free descriptor.
+  // Readable (poll) when the child has ended. A caller can wait for it together with other
+  // descriptors. Owned by this object; -1 if the process had no free descriptor.
   [[nodiscard]] int descriptor() const { return descriptor_.get(); }
 
   // signal() sends a signal to the child. signalGroup() sends it to all processes of the child's
-  // group, if it has a group of its own, and else to the child. Both do nothing after the end.
+  // group if the child has a group of its own, and otherwise only to the child. Both do nothing
+  // after the end.
   void signal(int number) const;
   void signalGroup(int number) const;
 
@@ -90,11 +90,11 @@ class ChildProcess {
   [[nodiscard]] std::optional<ChildEnd> poll() { return waitUntil(Clock::time_point::min()); }
   // Waits until the child ends.
   ChildEnd wait();
-  // Sends SIGKILL to the child, and to its group if it has one of its own, and waits for the end.
-  // After the end it returns what the child ended with.
+  // Sends SIGKILL to the child, and to its group if it has one of its own, and waits until the
+  // child has ended. Returns how it ended. If it had ended before, only returns that.
   ChildEnd kill();
 
-  // Gives the child up: it keeps running. The caller, or nobody, waits for the process returned.
+  // Gives up the child, which keeps running. Returns its process ID; the caller may wait for it.
   [[nodiscard]] pid_t detach();
 
  private:
@@ -114,8 +114,8 @@ struct Pipe {
 };
 [[nodiscard]] Result<Pipe, int> makePipe();
 
-// Returns our own environment as a child gets it, NAME=value, with `changes` in place of the
-// variables of the same names.
+// Returns a copy of our own environment, as NAME=value, in which `changes` replace the variables of
+// the same names.
 [[nodiscard]] std::vector<std::string> environmentWith(const std::vector<std::string>& changes);
 
 }  // namespace halvox::platform::linux_

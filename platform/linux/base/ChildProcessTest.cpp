@@ -33,7 +33,7 @@ class ChildProcessTest : public ::testing::Test {
     EXPECT_TRUE(child) << (child ? "" : child.error().message);
     return *std::move(child);
   }
-  // What is printed until nobody can print any more.
+  // Returns what is printed until no process has the pipe open for writing.
   std::string output() const {
     std::string text;
     std::array<char, 1024> piece;
@@ -181,7 +181,7 @@ TEST_F(ChildProcessTest, OtherDescriptorsCanBeClosed) {
   EXPECT_EQ(outputOf(program), "closed\n");
 }
 
-// Ignores one signal and blocks another while it lives.
+// Ignores one signal and blocks another while this object exists.
 class Signals {
  public:
   Signals() : before_(std::signal(SIGPIPE, SIG_IGN)) {
@@ -235,7 +235,7 @@ TEST_F(ChildProcessTest, GroupOfItsOwnIsKilledWithAllThatTheChildStarted) {
 
   EXPECT_EQ(child.kill().signal, SIGKILL);
 
-  EXPECT_EQ(output(), "");  // returns when neither of the two can print any more
+  EXPECT_EQ(output(), "");  // returns when neither process can print any more
 }
 
 TEST_F(ChildProcessTest, SessionOfItsOwnIsOnDemand) {

@@ -4,8 +4,8 @@
 #include <condition_variable>
 #include <mutex>
 
-// Annotations by which clang proves at compile time that shared fields are touched under their
-// lock. Other compilers see nothing.
+// With these annotations, clang proves at compile time that shared fields are accessed only under
+// their lock. For other compilers they are empty.
 #if defined(__clang__)
 #define HALVOX_THREAD_ANNOTATION(x) __attribute__((x))
 #else
@@ -17,7 +17,7 @@
 
 namespace halvox::platform::linux_ {
 
-// std::mutex as clang's analysis knows it.
+// A std::mutex with the annotations for clang's analysis.
 class HALVOX_THREAD_ANNOTATION(capability("mutex")) Mutex {
  public:
   void lock() HALVOX_THREAD_ANNOTATION(acquire_capability()) { mutex_.lock(); }
@@ -46,7 +46,8 @@ class HALVOX_THREAD_ANNOTATION(scoped_lockable) MutexLock {
   Mutex& mutex_;
 };
 
-// A condition to wait on under a Mutex; may wake up for nothing, so callers loop.
+// A condition to wait on under a Mutex; a wait may return without a notification, and callers must
+// loop.
 class Condition {
  public:
   void wait(Mutex& mutex) HALVOX_REQUIRES(mutex) { condition_.wait(mutex); }

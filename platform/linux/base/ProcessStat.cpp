@@ -11,7 +11,7 @@ namespace {
 
 constexpr int kStateField = 3;
 constexpr int kStartField = 22;
-// 52 fields of at most 20 digits and a name of at most 64 bytes take less.
+// 52 fields of at most 20 digits and a name of at most 64 bytes need less.
 constexpr std::size_t kMostBytes = 4096;
 
 std::optional<ProcessStat> readStat(const char* path) {

@@ -14,8 +14,9 @@ struct ProcessStat {
   std::uint64_t startTicks{};  // field 22: clock ticks from the start of the system to its start
 };
 
-// Parses the text of such a file. None if it ends before the start time does, or is malformed. The
-// command name in it may contain blanks, parentheses and line ends: a process chooses its own.
+// Parses the text of such a file. Returns std::nullopt if the text is malformed or ends before the
+// end of the start time. The command name in it may contain blanks, parentheses and line ends: each
+// process chooses its own name.
 [[nodiscard]] std::optional<ProcessStat> parseProcessStat(std::string_view text);
 
 // Reads the file of a process; none if there is no such process. Does not block. Any thread may

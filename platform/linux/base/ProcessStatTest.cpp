@@ -105,7 +105,7 @@ TEST(ProcessStatTest, ThisProcessStartedBeforeNow) {
   EXPECT_EQ(byNumber->startTicks, stat->startTicks);
 }
 
-// A child with that name, which waits until it is ended. It does not outlive this process.
+// A child with that name, which waits until the test ends it. It does not outlive this process.
 class NamedChild {
  public:
   explicit NamedChild(const char* name) {
@@ -127,7 +127,7 @@ class NamedChild {
     char ready = 0;
     return ::read(pipe_[0], &ready, 1) == 1;
   }
-  // Ends the child, which stays there as a process that nobody has waited for.
+  // Ends the child, which stays as a zombie because its parent has not waited for it.
   void end() const {
     ::kill(pid_, SIGKILL);
     siginfo_t info{};

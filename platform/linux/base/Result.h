@@ -8,9 +8,9 @@
 
 namespace halvox::platform::linux_ {
 
-// Why something could not be done: `code` for the caller, which decides by it, and `message` for
-// people, which names the object and the system's error ("/etc/x: Permission denied"). If nobody
-// decides by a code, Code is void and there is only the message.
+// Why something could not be done. The caller decides by `code`. `message` is for people, and names
+// the object and the system's error ("/etc/x: Permission denied"). If no caller needs a code, Code
+// is void and there is only the message.
 template <typename Code = void>
 struct Failure {
   Code code;
@@ -27,16 +27,16 @@ struct Failure<void> {
 //   if (!settings) return settings.error();
 //   use(*settings);
 //
-// To take the other one ends the process. The members are those of C++23's std::expected, which
-// this becomes an alias of one day; docs/decisions/0009-results.md says why it is our own until
-// then.
+// Taking the one that is not there ends the process. The members are those of C++23's
+// std::expected, and this becomes an alias of that one day. docs/decisions/0009-results.md says why
+// it is our own until then.
 template <typename Value, typename Code = void>
 class [[nodiscard]] Result {
  public:
   using Error = Failure<Code>;
 
-  // Implicit, so that a function returns its value or its error as it is. Also takes what converts
-  // to a value, such as std::nullopt where the value is a std::optional.
+  // Implicit, so that a function can return its value or its error directly. Also takes whatever
+  // converts to a value, such as std::nullopt if the value is a std::optional.
   template <typename Source = Value>
   requires(std::is_convertible_v<Source, Value> &&
            !std::is_same_v<std::remove_cvref_t<Source>, Result> &&

@@ -10,9 +10,9 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Five steps leave about a third of a processor to a thread that another one wants too, ten about a
-// tenth. Neither starves, so a lock that such a thread holds for a few instructions is released
-// soon.
+// If two threads compete for a processor, five steps leave about a third of it to the thread with
+// the lower priority, and ten steps about a tenth. Neither thread starves: a lock that it holds for
+// a few instructions is released soon.
 int stepsBelowMainThread(ThreadPriority priority) {
   switch (priority) {
     case ThreadPriority::kNormal:
@@ -36,8 +36,8 @@ sigset_t blockAllSignals() {
 }  // namespace
 
 void setUpThread(std::string_view label) {
-  // The kernel's limit; a longer name is refused as a whole. The end of a label says more than its
-  // start, which all queues share.
+  // The kernel refuses a longer name as a whole. The end of a label says more than its start, which
+  // all queues share.
   constexpr std::size_t kLongestName = 15;
   while (label.size() > kLongestName) {
     const std::size_t dot = label.find('.');

@@ -6,8 +6,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Owns one handle of a C library and gives it back with `kRelease`, whose result is ignored.
-// Move-only; an empty one holds `kNone` and gives nothing back.
+// Owns one handle of a C library and releases it with `kRelease`, whose result is ignored.
+// Move-only. An empty one holds `kNone` and releases nothing.
 //
 //   using Bus = UniqueHandle<sd_bus*, sd_bus_flush_close_unref>;
 //   Bus bus;
@@ -27,7 +27,7 @@ class UniqueHandle {
   [[nodiscard]] Raw get() const noexcept { return raw_; }
   explicit operator bool() const noexcept { return raw_ != kNone; }
 
-  // Gives the handle up without releasing it.
+  // Gives up the handle without calling `kRelease`.
   [[nodiscard]] Raw release() noexcept { return std::exchange(raw_, kNone); }
   // Releases what is held and takes `raw` instead.
   void reset(Raw raw = kNone) noexcept {

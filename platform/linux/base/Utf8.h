@@ -9,14 +9,14 @@ namespace halvox::platform::linux_ {
 // UTF-8 for the outer ring and the client library. Valid UTF-8 has no overlong forms, no surrogates
 // and nothing above U+10FFFF. All functions take any bytes, and any thread may call them.
 //
-// The inner ring cannot include this header. It has its own line of code in
-// session/SummaryFileName.cpp, where text that is already valid is cut between two characters. The
-// fake of the process service has its own replacement of invalid bytes too: the contract suite
-// compares it with what the adapter does by means of this header.
+// The inner ring cannot include this header. session/SummaryFileName.cpp has a line of its own,
+// which cuts valid text between two characters. The fake of the process service has its own
+// replacement of invalid bytes too: the contract suite compares it with what the adapter does by
+// means of this header.
 
 // One step through bytes that should be UTF-8.
 struct Utf8Step {
-  std::size_t length = 1;  // bytes of the character, or 1 for a byte that does not begin one
+  std::size_t length = 1;  // bytes of the character; 1 if the byte does not begin one
   bool valid = false;
   char32_t character = 0;  // of a valid step
 };
@@ -27,8 +27,8 @@ struct Utf8Step {
 // True for valid UTF-8. Tests ASCII eight bytes at a time.
 [[nodiscard]] bool isUtf8(std::string_view text);
 
-// True for valid UTF-8 without a NUL, which is what D-Bus and C take as a text. This is on the path
-// of every message, so it is one pass: a separate search for the NUL would read the text twice.
+// True for valid UTF-8 without a NUL, which is what D-Bus and C take as a text. It runs for every
+// message and therefore makes one pass: a separate search for the NUL would read the text twice.
 [[nodiscard]] bool isUtf8WithoutNul(std::string_view text);
 
 // True for a byte that continues a character.
@@ -36,7 +36,7 @@ struct Utf8Step {
   return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U;
 }
 
-// Returns the longest beginning of `text` that has at most `most` bytes and does not end within a
+// Returns the longest prefix of `text` that has at most `most` bytes and does not end inside a
 // character. If `text` is not valid, invalid bytes near the cut may be removed, too.
 [[nodiscard]] std::string_view utf8Prefix(std::string_view text, std::size_t most);
 

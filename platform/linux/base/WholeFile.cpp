@@ -21,7 +21,7 @@ void fail(FileContent& content, int error) {
   content.error = error;
 }
 
-// Keeps what is known of the file. Returns false if it is not one to read.
+// Stores the size and mode of the file. Returns false if the file must not be read.
 bool accept(const FileToRead& file, const struct stat& status, FileContent& content) {
   content.size = static_cast<std::uint64_t>(status.st_size);
   content.mode = status.st_mode;
@@ -35,7 +35,7 @@ bool accept(const FileToRead& file, const struct stat& status, FileContent& cont
   return !isRefused;
 }
 
-// Looks at the file before it is opened. Returns false if it is not to be opened.
+// Checks the file before it is opened. Returns false if it must not be opened.
 bool isToBeOpened(const FileToRead& file, FileContent& content) {
   if (file.kinds == FileToRead::Kinds::kAny) return true;
   const bool refusesLinks = file.links == FileToRead::Links::kRefused;
@@ -45,7 +45,7 @@ bool isToBeOpened(const FileToRead& file, FileContent& content) {
     return false;
   }
   if (S_ISLNK(status.st_mode)) {
-    fail(content, ELOOP);  // what open() says with O_NOFOLLOW
+    fail(content, ELOOP);  // the error of open() with O_NOFOLLOW
     return false;
   }
   return accept(file, status, content);
@@ -77,7 +77,8 @@ void readAll(int descriptor, const FileToRead& file, FileContent& content) {
 FileContent readWholeFile(const FileToRead& file) {
   FileContent content;
   if (!isToBeOpened(file, content)) return content;
-  // O_NONBLOCK: opening a pipe that has no writer would block, and the file may have become one.
+  // O_NONBLOCK: another process may have put a pipe in the file's place, and opening a pipe without
+  // a writer would block.
   const int links = file.links == FileToRead::Links::kRefused ? O_NOFOLLOW : 0;
   const UniqueFd descriptor(
       ::openat(file.directory, file.path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | links));
@@ -85,14 +86,14 @@ FileContent readWholeFile(const FileToRead& file) {
     fail(content, errno);
     return content;
   }
-  // Looked at again: another file may have taken the name since.
+  // Check again: another file may have taken the name since the first check.
   struct stat status {};
   if (::fstat(descriptor.get(), &status) != 0) {
     fail(content, errno);
     return content;
   }
   if (!accept(file, status, content)) return content;
-  // A pipe may be read after all. Its reader has to wait for what the writer sends.
+  // The caller allows pipes. Reads must block until the writer has sent something.
   if (file.kinds == FileToRead::Kinds::kAny) ::fcntl(descriptor.get(), F_SETFL, 0);
   readAll(descriptor.get(), file, content);
   return content;

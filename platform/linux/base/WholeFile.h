@@ -13,7 +13,7 @@ namespace halvox::platform::linux_ {
 
 // Which file to read, and how.
 struct FileToRead {
-  // kRegular, unless the text may come through a pipe. Opening a device may have an effect, and
+  // Use kRegular unless the text may come through a pipe. Opening a device may have an effect, and
   // reading a pipe waits for its writer.
   enum class Kinds : std::uint8_t { kRegular, kAny };
   // Whether a symbolic link in the last component of the path is followed.
@@ -33,7 +33,7 @@ struct FileToRead {
 struct FileContent {
   enum class Outcome : std::uint8_t {
     kRead,        // `bytes` is the whole file
-    kMissing,     // there is no such file, or no directory on the way to it
+    kMissing,     // the file or a directory of its path does not exist
     kNotRegular,  // a directory, pipe, socket or device; `mode` says which
     kTooLarge,    // more than `most` bytes; `bytes` has the first `most` with Excess::kCut
     kFailed,      // `bytes` has what was read before the error
@@ -42,7 +42,7 @@ struct FileContent {
   Outcome outcome = Outcome::kFailed;
   int error = 0;  // errno of kMissing and kFailed
   std::string bytes{};
-  // As the file system says when the file is opened; 0 before.
+  // From the file system, when the file is opened; 0 before that.
   std::uint64_t size = 0;  // 0 for the files of /proc
   mode_t mode = 0;         // type and permissions
 
@@ -56,8 +56,8 @@ struct FileContent {
 // may grow meanwhile. Any thread may call it.
 [[nodiscard]] FileContent readWholeFile(const FileToRead& file);
 
-// Returns a directory to read files below, or an empty handle, with errno set, if it cannot be
-// opened. A relative path starts at `below`.
+// Opens a directory for reading files below it. Returns an empty handle, with errno set, if it
+// cannot be opened. A relative path starts at `below`.
 [[nodiscard]] UniqueFd openDirectory(const char* path, int below = AT_FDCWD);
 
 }  // namespace halvox::platform::linux_

@@ -50,7 +50,7 @@ bool waitUntilEmpty(int pipe) {
 }
 
 TEST_F(WholeFileTest, ReadsAFileWithItsSizeAndMode) {
-  const std::string text(40'000, 'x');  // some pieces
+  const std::string text(40'000, 'x');  // more than one piece
   const std::string path = write("file", text);
   ASSERT_EQ(::chmod(path.c_str(), 0640), 0);
 
@@ -123,7 +123,7 @@ TEST_F(WholeFileTest, NeitherPipesNorDevicesNorDirectoriesAreRead) {
 
 TEST_F(WholeFileTest, AnyKindReadsWhatIsWrittenIntoAPipe) {
   const std::string pipe = makePipe();
-  // Open for both directions, the test is a writer: the reader cannot come before there is one.
+  // Opened for reading and writing: the pipe then has a writer before the reader opens it.
   UniqueFd writer(::open(pipe.c_str(), O_RDWR | O_CLOEXEC));
   ASSERT_EQ(::write(writer.get(), "first ", 6), 6);
   FileContent content;

@@ -19,7 +19,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// A device or a wrong path must not fill the memory at the start.
+// A wrong path, such as that of a device, must not fill the memory at the start.
 constexpr std::size_t kLargestFile = 1U << 20U;
 // Less than PATH_MAX, with room for the names of files below the path.
 constexpr std::size_t kLongestPath = 4000;
@@ -52,9 +52,9 @@ Failure<ConfigurationError> unreadable(const std::filesystem::path& file, int er
                               errnoText(error)))};
 }
 
-// The file's text; none when there is no such file. It may be a pipe, such as the one that a shell
-// makes of <(command). Opening one does not block: a pipe that nobody writes to must not hold up
-// the start.
+// Returns the file's text, or std::nullopt if the file does not exist. The file may be a pipe, such
+// as the one that a shell makes of <(command). Opening a pipe does not block: a pipe without a
+// writer must not delay the start.
 Result<std::optional<std::string>, ConfigurationError> readText(const std::filesystem::path& file) {
   FileContent content =
       readWholeFile({.path = file.c_str(), .most = kLargestFile, .kinds = FileToRead::Kinds::kAny});
@@ -77,15 +77,15 @@ Result<std::optional<std::string>, ConfigurationError> readText(const std::files
 
 bool isNotEmpty(std::string_view text) { return !text.empty(); }
 
-// Three octal digits after a zero, of which the first lets the owner connect.
+// A zero and three octal digits. The first of the three must let the owner connect.
 bool isMode(std::string_view text) {
   return text.size() == 4 && text[0] == '0' && (text[1] == '6' || text[1] == '7') &&
          std::ranges::all_of(text, [](char digit) { return digit >= '0' && digit <= '7'; });
 }
 
-// The mode without a setting. With a group, its members may connect. A socket in the runtime
-// directory of a login is for that user. A service of the system is for every user, because the
-// programs of every user report.
+// Returns the mode that applies without a setting. If a group is set, its members may connect. A
+// socket in the runtime directory of a login is for that user only. The socket of a system service
+// is for all users, because the programs of all users report.
 std::uint32_t defaultMode(const Configuration::Listener& listener) {
   constexpr std::uint32_t kUser = 0600;
   constexpr std::uint32_t kGroup = 0660;
@@ -124,7 +124,7 @@ void readStorage(TableReader table, Configuration::Storage& storage) {
   table.read("retention_days", kDays, days);
   table.read("max_megabytes", kMegabytes, megabytes);
   table.finish();
-  // Only now: the default depends on the directory that the file names.
+  // Set last: the default depends on the directory that the file names.
   storage.root = root.empty() ? storage.directory / "root" : root;
   storage.retentionDays = static_cast<std::uint32_t>(days);
   storage.maxMegabytes = static_cast<std::uint32_t>(megabytes);
@@ -133,8 +133,8 @@ void readStorage(TableReader table, Configuration::Storage& storage) {
 void readAnalytics(TableReader table, Configuration::Analytics& analytics) {
   std::size_t sink = 0;
   table.read("wanted", analytics.wanted);
-  // Read although there is one choice: a file that asks for another sink must not start a service
-  // that sends events elsewhere.
+  // Read the key although it has only one valid value. If a file asks for another sink, the service
+  // must not start and send events elsewhere.
   table.readChoice("sink", {"sqlite"}, sink);
   table.finish();
 }
@@ -173,7 +173,8 @@ void readLinkTls(TableReader table, std::optional<Configuration::Link::Tls>& res
   table.read("certificate", tls.certificate, kLongestPath);
   table.read("key", tls.key, kLongestPath);
   table.read("verify", tls.verify);
-  // The link needs both: it would ignore a key alone, and the servers would then refuse it.
+  // The link needs both. It would ignore a key without a certificate, and the servers would then
+  // refuse the link.
   if (tls.key.empty()) table.refuse("certificate", "a path together with link.tls.key");
   if (tls.certificate.empty()) table.refuse("key", "a path together with link.tls.certificate");
   table.finish();
@@ -229,7 +230,7 @@ void readDirectory(TableReader table, std::filesystem::path& directory) {
   table.finish();
 }
 
-// Directories that are in the storage directory unless the file says otherwise.
+// Sets the directories that are in the storage directory unless the file says otherwise.
 void setDefaultDirectories(Configuration& configuration) {
   configuration.preferencesDirectory = configuration.storage.directory / "preferences";
   configuration.notifyDirectory = configuration.storage.directory / "notify";
@@ -247,8 +248,9 @@ void readDrivers(TableReader table, Configuration::Drivers& drivers) {
 Result<Configuration, ConfigurationError> parse(const std::string& file, std::string_view text,
                                                 const DefaultPlaces& places) {
   ConfigurationMistakes mistakes(file);
-  // Before the parser, which bounds brackets but not dots: a key of 100,000 words makes as many
-  // tables, and walking through them overflows the stack.
+  // Check before parsing: the parser limits the depth of brackets, but not the number of dots in a
+  // key. A key of 100,000 words makes 100,000 nested tables, and walking through them overflows the
+  // stack.
   if (const auto line = lineNestedTooDeep(text)) {
     mistakes.add(
         {static_cast<toml::source_index>(*line), 1},
@@ -267,7 +269,8 @@ Result<Configuration, ConfigurationError> parse(const std::string& file, std::st
   TableReader root(&parsed.table(), "", mistakes);
   readListener(root.table("listener"), configuration.listener);
   readStorage(root.table("storage"), configuration.storage);
-  // Before the tables that may replace them, and after the storage, whose directory they are in.
+  // After the storage table, which names their parent directory, and before the tables that may
+  // replace them.
   setDefaultDirectories(configuration);
   readDirectory(root.table("preferences"), configuration.preferencesDirectory);
   readDirectory(root.table("notify"), configuration.notifyDirectory);
@@ -292,8 +295,8 @@ std::filesystem::path configurationPath() {
   const std::filesystem::path own =
       environmentPath("XDG_CONFIG_HOME").value_or(homeDirectory() / ".config") /
       "halvox/halvox.toml";
-  // Only a missing file is passed over. One that cannot be read is an error, which using the
-  // system's file instead would hide.
+  // Use the system's file only if the user's is missing. A user's file that cannot be read is an
+  // error, which the system's file would hide.
   const bool isMissing = ::access(own.c_str(), F_OK) != 0 && (errno == ENOENT || errno == ENOTDIR);
   return isMissing ? "/etc/halvox/halvox.toml" : own;
 }
@@ -315,13 +318,13 @@ Result<Configuration, ConfigurationError> loadConfiguration(const DefaultPlaces&
   const auto text = readText(file);
   if (!text) return text.error();
   if (text->has_value()) return parse(file.native(), **text, places);
-  // A file that the user has named must exist. A default place may be empty.
+  // A file that the environment names must exist. The default places may be empty.
   if (configurationVariable() != nullptr) return unreadable(file, ENOENT);
   return defaultConfiguration(places);
 }
 
 Result<std::filesystem::path, ConfigurationError> configuredSocket() {
-  // Without a default socket: a socket in the result is then one that the file names.
+  // Load without a default socket: if the result then has a socket, the file names it.
   auto loaded = loadConfiguration({.socket = {}, .storageDirectory = defaultStorageDirectory()});
   if (loaded) return std::move(loaded->listener.socket);
   const bool isHidden =

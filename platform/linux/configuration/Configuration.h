@@ -82,7 +82,7 @@ struct Configuration {
   std::filesystem::path preferencesDirectory;  // [preferences]: <directory>/<user>/<domain>.toml
   std::filesystem::path notifyDirectory;       // [notify]: files that post by their names
   LogLevel logLevel = LogLevel::kDefault;
-  // The least level of the lines that the log keeps in memory for captures of diagnostics.
+  // The lowest level of the lines that the log keeps in memory for captures of diagnostics.
   LogLevel logMemoryLevel = LogLevel::kInfo;
   std::uint32_t keepSnapshots = defaults::kKeptSnapshots;
   Dictionary device;         // [device]: property to value
@@ -107,8 +107,8 @@ struct DefaultPlaces {
   std::filesystem::path storageDirectory;
 };
 
-// The default places of a service, from its environment: $RUNTIME_DIRECTORY, $STATE_DIRECTORY, else
-// $XDG_RUNTIME_DIR and $XDG_STATE_HOME.
+// The default places of a service, from its environment: $RUNTIME_DIRECTORY and $STATE_DIRECTORY,
+// else $XDG_RUNTIME_DIR and $XDG_STATE_HOME.
 DefaultPlaces placesOfService();
 
 // The configuration without a file: all defaults.
@@ -122,7 +122,7 @@ Result<Configuration, ConfigurationError> loadConfiguration(
 
 // Returns the socket that the configuration names, for programs that look for the service; empty if
 // it names none. Also empty if this user may not read the file and $HALVOX_CONFIG does not name it:
-// the system's file may be readable to the service alone.
+// the system's file may be readable only by the service.
 Result<std::filesystem::path, ConfigurationError> configuredSocket();
 
 }  // namespace halvox::platform::linux_

@@ -12,7 +12,7 @@
 
 #include "platform/linux/configuration/Configuration.h"
 
-// Compares docs/configuration.md with the keys and defaults that the service has.
+// Compares docs/configuration.md with the keys and defaults of the service.
 
 namespace halvox::platform::linux_ {
 namespace {

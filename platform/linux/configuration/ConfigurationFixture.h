@@ -24,7 +24,8 @@ inline constexpr const char* kVariables[] = {"HALVOX_CONFIG",
                                              "XDG_STATE_HOME",
                                              "HOME"};
 
-// Sets a scratch directory as home and unsets all other variables that the configuration reads.
+// Uses a scratch directory as the home directory and unsets all other variables that the
+// configuration reads.
 class ConfigurationFixture : public ::testing::Test {
  protected:
   void SetUp() override {

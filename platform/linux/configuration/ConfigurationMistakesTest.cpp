@@ -2,7 +2,7 @@
 
 #include "platform/linux/configuration/ConfigurationFixture.h"
 
-// A mistake in a configuration is reported with its place.
+// Tests how mistakes in a configuration are reported.
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -155,7 +155,7 @@ TEST_F(ConfigurationMistakesTest, SyntaxErrorIsReportedWithItsPlace) {
 }
 
 TEST_F(ConfigurationMistakesTest, TextThatIsNotUtf8IsAMistake) {
-  // The place is that of the last character before it.
+  // The reported place is that of the last character before the mistake.
   EXPECT_THAT(mistake("[listener]\nsocket = \"/\xFF\"\n"),
               StartsWith("2:11: the file: expected TOML, found a mistake: "));
 }

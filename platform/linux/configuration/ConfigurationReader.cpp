@@ -23,7 +23,7 @@ std::string inQuotes(std::string_view text) {
   return result + (taken < text.size() ? "…\"" : "\"");
 }
 
-// Describes to the user what the file has.
+// Describes the value in the file for the user.
 std::string found(const toml::node& node) {
   if (const auto* text = node.as_string()) return "the string " + inQuotes(text->get());
   if (const auto* number = node.as_integer()) return fmt::format("{}", number->get());
@@ -76,7 +76,7 @@ std::optional<Date> toDate(const toml::date_time& time) {
 }  // namespace
 
 void ConfigurationMistakes::add(const toml::source_position& where, std::string_view what) {
-  // The checks run in the order of the code, and users fix a file from its top.
+  // The checks run in the order of the code, but users fix a file from its top.
   if (first_.has_value() && !(where < firstPosition_)) return;
   std::string line;
   appendEscaped(line, fmt::format("{}:{}:{}: {}", file_, where.line, where.column, what),
@@ -113,7 +113,7 @@ void TableReader::read(std::string_view key, std::vector<std::string>& result) {
   if (node == nullptr) return;
   const toml::array* array = node->as_array();
   if (array == nullptr) return expected(*node, key, kExpected);
-  // Collected apart: after a mistake, `result` still has its default.
+  // Collect the values separately: after a mistake, `result` must still have its default.
   std::vector<std::string> texts;
   for (const toml::node& element : *array) {
     const auto* text = element.as_string();
@@ -168,8 +168,8 @@ void TableReader::read(std::string_view key, NumberRange range, std::uint64_t& r
   const toml::node* node = find(key);
   if (node == nullptr) return;
   const auto* number = node->as_integer();
-  // TOML's integers are signed and the range is not. A plain comparison would take -1 for a large
-  // number.
+  // TOML's integers are signed and the limits are unsigned. A plain comparison would treat -1 as a
+  // large number.
   if (number == nullptr || std::cmp_less(number->get(), range.least) ||
       std::cmp_greater(number->get(), range.greatest)) {
     return expected(*node, key,
@@ -245,7 +245,8 @@ void TableReader::finish() {
 }
 
 const toml::node* TableReader::find(std::string_view key) {
-  // Noted even if the file does not have the key: an unknown key is compared with all of them.
+  // Note the name even if the file does not have the key: the error for an unknown key suggests one
+  // of these names.
   known_.emplace_back(key);
   return table_ == nullptr ? nullptr : table_->get(key);
 }

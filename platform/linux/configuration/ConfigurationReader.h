@@ -27,8 +27,8 @@ class ConfigurationMistakes {
  public:
   explicit ConfigurationMistakes(std::string file) : file_(std::move(file)) {}
 
-  // Adds the mistake "FILE:LINE:COLUMN: what". Control characters are escaped, so that the error
-  // stays one line.
+  // Adds the mistake "FILE:LINE:COLUMN: what". Escapes control characters, because the error must
+  // stay on one line.
   void add(const toml::source_position& where, std::string_view what);
   [[nodiscard]] const std::optional<Failure<ConfigurationError>>& first() const { return first_; }
 
@@ -43,10 +43,10 @@ struct NumberRange {
   std::uint64_t greatest;
 };
 
-// One table of the file. Every read names its key, so that finish() can report the keys that nobody
-// read. `result` holds the default before a read. A read leaves it unchanged if the key is absent.
-// It also does if the value is not as expected, and adds a mistake. Refers to the parsed file and
-// to `mistakes`, which must outlive it. Belongs to one thread.
+// One table of the file. Every read names its key: finish() can then report the keys that were not
+// read. `result` holds the default before a read. A read leaves it unchanged if the key is absent
+// or the value is not as expected. In the second case it also adds a mistake. Refers to the parsed
+// file and to `mistakes`, which must outlive it. Belongs to one thread.
 class TableReader {
  public:
   // `table` is null for a table that the file does not have. `name` is empty for the root.
@@ -78,7 +78,7 @@ class TableReader {
   [[nodiscard]] bool isPresent() const { return table_ != nullptr; }
   // Adds a mistake for `key`, if it is present; `what` describes what was expected.
   void refuse(std::string_view key, std::string_view what);
-  // Adds a mistake for each key that nobody read. Call it last.
+  // Adds a mistake for each key that was not read. Call it last.
   void finish();
 
  private:

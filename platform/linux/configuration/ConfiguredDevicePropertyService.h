@@ -8,8 +8,8 @@
 
 namespace halvox::platform::linux_ {
 
-// The device properties that the configuration file sets. Immutable. Any thread may call. Owned by
-// the platform.
+// The device properties that the configuration file sets. Immutable. Any thread may use it. Owned
+// by the platform.
 class ConfiguredDevicePropertyService final : public DevicePropertyService {
  public:
   explicit ConfiguredDevicePropertyService(Dictionary properties)

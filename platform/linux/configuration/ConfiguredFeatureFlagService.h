@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The feature switches that the configuration file sets. Immutable. Any thread may call. Owned by
+// The feature switches that the configuration file sets. Immutable. Any thread may use it. Owned by
 // the platform.
 class ConfiguredFeatureFlagService final : public FeatureFlagService {
  public:

@@ -4,15 +4,14 @@
 #include <cstdint>
 
 // The defaults of settings, each stated once with its unit and its reason. Configuration and the
-// options of the adapters take theirs from here, so that an adapter made by a test or a tool
-// behaves like that of a service without a configuration file. docs/configuration.md repeats the
-// values; a test compares the page with what is read. Defaults that no adapter needs are in
+// options of the adapters take their defaults from here. An adapter made by a test or a tool
+// therefore behaves like that of a service without a configuration file. docs/configuration.md
+// repeats the values; a test compares the page with the code. Defaults that no adapter needs are in
 // Configuration.h.
 namespace halvox::platform::linux_::defaults {
 
-// [listener]
-// A local client authenticates within milliseconds. 30 seconds are enough on a machine that swaps,
-// and still free the descriptors of clients that connect and stay silent.
+// [listener] A local client authenticates within milliseconds. 30 seconds are enough on a machine
+// that swaps, and still free the descriptors of clients that connect and stay silent.
 inline constexpr std::chrono::seconds kHandshakeTimeout{30};
 // From the first byte of a message to its last. Longer than the handshake, because a message may
 // have 32 MiB.
@@ -20,8 +19,7 @@ inline constexpr std::chrono::seconds kMessageTimeout{60};
 // Permission bits of the socket of a system service: the audio programs of all users connect to it.
 inline constexpr std::uint32_t kSocketModeOfSystem = 0666;
 
-// [storage]
-// Days. A month covers "it broke after the last update" without growing for ever.
+// [storage] Days. A month covers "it broke after the last update" without growing forever.
 inline constexpr std::uint32_t kRetentionDays = 30;
 // MiB of database and write-ahead log together: room for roughly a million records of 500 bytes,
 // and little on the disk of a desktop machine.

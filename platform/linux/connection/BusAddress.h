@@ -21,8 +21,8 @@ struct BusSocket {
 // transports and malformed entries.
 std::vector<BusSocket> parseBusAddress(std::string_view addresses);
 
-// The address of a bus: from the environment, else the default one. Empty for no bus, and for a
-// session bus when the environment does not name one.
+// The address of a bus: from the environment, else the default one. Empty for kNone, and for a
+// session bus that the environment does not name.
 std::string busAddressOf(BusKind bus);
 
 // The bus that started a process.

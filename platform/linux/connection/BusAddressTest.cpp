@@ -39,7 +39,8 @@ TEST(BusAddressTest, NonsenseIsSkipped) {
 
 class StarterBusTest : public testing::Test {
  protected:
-  // The one that an environment with these three variables names; null: the variable is not set.
+  // The bus that an environment with these three variables names. Null means that the variable is
+  // not set.
   static std::optional<StarterBus> starterOf(const char* type, const char* address,
                                              const char* systemBus = nullptr) {
     set("DBUS_STARTER_BUS_TYPE", type);

@@ -47,7 +47,7 @@ BusConnection::~BusConnection() { abandon(); }
 
 void BusConnection::start() {
   stream_.setReading(true);
-  // Messages that the connector has read already do not make the socket readable again.
+  // The socket does not become readable because of messages that the connector has already read.
   handleFrames();
   stream_.input().settle();
 }
@@ -88,12 +88,13 @@ void BusConnection::handleFrames() {
     next.state == FrameBuffer::State::kOversized ? handleOversized(next) : handleFrame(next);
     stream_.input().consume(next.totalBytes);
   }
-  // After all frames of the read were sorted, so that each sender has its share of the turn.
+  // Deliver after all frames of the read have been sorted by sender: each sender then gets its
+  // share of the turn.
   for (const std::shared_ptr<BusSender>& sender : std::exchange(touched_, {})) {
     sender->deliverReceived();
   }
-  // The bus reads our replies at its own pace. Until it does, do not read more requests, since each
-  // adds a reply.
+  // The bus reads our replies at its own pace. Until it has, do not read more requests, because
+  // each adds a reply.
   if (stream_.output().unsentBytes() >= kMaxUnreadReplyBytes) stream_.setReading(false);
 }
 
@@ -139,7 +140,7 @@ void BusConnection::handleSignal(const dbus::Frame& frame) {
   std::vector<Value> names;  // the name, its old owner, its new one
   if (dbus::decodeBody(frame, "sss", names).has_value() || !names[2].string().empty()) return;
   const auto found = senders_.find(names[0].string());
-  // A copy of the pointer keeps it alive: its end can remove it from the map.
+  // Copy the pointer to keep the sender alive: when a sender ends, it may be removed from the map.
   if (found != senders_.end()) std::shared_ptr(found->second)->onVanished();
 }
 

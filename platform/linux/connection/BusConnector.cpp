@@ -18,7 +18,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// A local bus answers within milliseconds. The start of the service must not hang on a broken one.
+// A local bus answers within milliseconds. A broken bus must not hang the start of the service.
 constexpr std::chrono::seconds kBusTimeout{5};
 constexpr std::uint32_t kDoNotQueue = 4;    // flag of RequestName: fail if the name is taken
 constexpr std::uint32_t kPrimaryOwner = 1;  // answers of RequestName
@@ -53,19 +53,20 @@ BusConnector::BusConnector(std::string busName)
     : busName_(std::move(busName)), input_(dbus::kMaxMessageBytes) {}
 
 Result<BusSession, ConnectionOpenError> BusConnector::connect(const std::string& address) {
-  // One deadline for all steps: a bus that answers each of them slowly must not hold up the start
-  // either.
+  // One deadline for all steps: a bus that answers each step slowly must not delay the start for
+  // long either.
   deadline_ = std::chrono::steady_clock::now() + kBusTimeout;
   if (Outcome done = connectToFirst(address); !done) return std::move(done).error();
   if (Outcome done = authenticate(); !done) return std::move(done).error();
   const auto ignore = [](const Value&) -> Outcome { return {}; };
   if (Outcome done = call("Hello", "", {}, "s", ignore); !done) return std::move(done).error();
   const std::array rule = {Value(kVanishingNames)};
-  // Before the name: once it is ours, a sender can call and leave, and its end must not be missed.
+  // Ask for these signals before the name. Once the name is ours, a sender can call and leave, and
+  // its end must not be missed.
   if (Outcome done = call("AddMatch", "s", rule, "", ignore); !done) return std::move(done).error();
   if (Outcome done = requestName(); !done) return std::move(done).error();
   const std::span<const std::byte> rest = input_.unused();
-  // Requests may have come right after the name was ours.
+  // Requests may have arrived right after the name became ours.
   kept_.insert(kept_.end(), rest.begin(), rest.end());
   return BusSession{.fd = std::move(fd_), .unused = std::move(kept_), .lastSerial = lastSerial_};
 }
@@ -73,8 +74,8 @@ Result<BusSession, ConnectionOpenError> BusConnector::connect(const std::string&
 BusConnector::Outcome BusConnector::connectToFirst(const std::string& address) {
   address_ = address;
   std::string reasons;
-  // An address may list several sockets, of which the first that accepts is the bus. All reasons
-  // are in the error, because any of them may be the cause.
+  // An address may list several sockets. The first one that accepts is the bus. The error has the
+  // reasons of all attempts, because any of them may be the cause.
   for (const BusSocket& socket : parseBusAddress(address)) {
     Result<UniqueFd> connected = connectTo(socket);
     if (connected) {
@@ -170,7 +171,7 @@ Result<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::uint32
     }
     const dbus::Frame& frame = std::get<dbus::Frame>(read);
     if (frame.header.replySerial == serial) return frame;
-    // Not an answer but a signal or an early request. The connection handles it later.
+    // This message is a signal or an early request. The connection handles it later.
     kept_.insert(kept_.end(), answer_.begin(), answer_.end());
   }
 }

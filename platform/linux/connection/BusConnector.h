@@ -27,8 +27,9 @@ struct BusSession {
 };
 
 // Connects to a bus: the handshake, Hello, a match rule for senders that leave, and the service's
-// name. One object connects once. Blocks the calling thread, at most for kBusTimeout (5 s) in all;
-// only used before the service serves anybody. A failure names the address and the reason.
+// name. One object connects once. Blocks the calling thread for at most kBusTimeout (5 s) in all,
+// and is therefore only used before the service accepts clients. A failure names the address and
+// the reason.
 class BusConnector {
  public:
   explicit BusConnector(std::string busName);

@@ -30,7 +30,8 @@ std::string BusSender::description() const {
 
 void BusSender::receive(const dbus::MessageHeader& header, std::span<const std::byte> frame) {
   const std::size_t waiting = input_.unused().size();
-  // One request always fits, up to the limit of frames: the bound is for those that pile up.
+  // One request is always accepted, up to the size limit of frames: the bound is for requests that
+  // pile up.
   if (waiting == 0 || waiting + frame.size() <= kMaxWaitingBytesOfSender) {
     input_.append(frame);
     return;
@@ -44,7 +45,7 @@ void BusSender::receive(const dbus::MessageHeader& header, std::span<const std::
 void BusSender::receiveOversized(const FrameBuffer::Next& next) { refuseOversized(next); }
 
 void BusSender::deliverReceived() {
-  // Not while flow control holds the sender back; it becomes due when there is room.
+  // Skip a sender that flow control holds back. It becomes due when it has room again.
   if (wantsInput()) deliver();
 }
 
@@ -80,8 +81,8 @@ void BusSender::onDelivered(bool /*begun*/, bool /*progress*/) {
 
 void BusSender::onFinished() { bus_.forget(*this); }
 
-// Does not close the connection, because all senders share it, and because the bus forwards valid
-// frames only: this one request is bad, and the stream is not.
+// Does not close the connection: all senders share it. The bus forwards only valid frames, which
+// means that the stream is still intact.
 void BusSender::onMalformed(const std::string& what) {
   kLog.error("dropped a message of ", description(), ": not a valid D-Bus message: ", what);
   host().statistics().connectionsMalformed.add();

@@ -20,7 +20,7 @@ class BusConnection;
 // is, and while flow control holds the sender back. The bus cannot be asked to hold one sender
 // back, so requests beyond kMaxWaitingBytesOfSender are refused. Replies that the sender does not
 // read are kept and bounded by the bus. A sender that left before the bus could answer is served as
-// process 0 of an unknown user: its requests were sent, and some need no reply. Belongs to the I/O
+// process 0 of an unknown user, because some of its requests may need no reply. Belongs to the I/O
 // thread. Shared by the bus's connection and the delegate.
 class BusSender final : public ClientConnection, private DeadlineOwner {
  public:
@@ -38,7 +38,7 @@ class BusSender final : public ClientConnection, private DeadlineOwner {
   void deliverReceived();
   // The bus has given the sender's credentials, or has not answered in time.
   void onCredentials(const PeerCredentials& credentials);
-  // The bus says that the name has no owner any more.
+  // The bus reports that the name has lost its owner.
   void onVanished();
   void onBusLost();
   // The bus has read some of the replies.

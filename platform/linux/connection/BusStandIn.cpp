@@ -1,5 +1,5 @@
-// What clients of a bus ask their bus for, answered by the service itself when there is no bus
-// between. The service is known under its well-known name and as ":1.0", the client as ":1.N".
+// Answers the requests that clients of a bus send to their bus, for clients that are connected
+// without one. The service is known under its well-known name and as ":1.0", the client as ":1.N".
 
 #include <array>
 #include <cstdint>
@@ -46,7 +46,7 @@ StandardAnswer hello(const StandardRequest& request) {
   return {.errorName = error_names::kFailed, .errorText = "the connection has its name already"};
 }
 
-// Nothing is ever signalled to clients, so a match can be taken without keeping it.
+// The service sends no signals to clients. A match can therefore be accepted without storing it.
 StandardAnswer takeMatch(const StandardRequest& /*request*/) { return {}; }
 
 StandardAnswer getNameOwner(const StandardRequest& request) {
@@ -85,7 +85,7 @@ StandardAnswer getConnectionUnixProcessId(const StandardRequest& request) {
   const std::optional<std::string> owner = ownerOf(request, name);
   if (!owner.has_value()) return nobodyHas(name);
   const bool isClient = *owner == uniqueNameOf(request.client);
-  // All other names that have an owner are the service's own.
+  // All other names with an owner belong to the service.
   return {.value = Value(static_cast<std::uint32_t>(isClient ? request.client.processIdentifier()
                                                              : getpid()))};
 }

@@ -191,7 +191,8 @@ TEST_F(BusTest, LossOfTheBusEndsItsSendersAndNothingElse) {
   EXPECT_EQ(onSocket.call("echo", "b").text, "b");
 }
 
-// Sends calls that are answered when the test says so, without waiting for the answers.
+// Sends calls that the service answers only when the test releases them. Does not wait for the
+// answers.
 void flood(BusClient& client, std::size_t calls, const std::string& member) {
   for (std::size_t call = 0; call < calls; ++call) {
     BusMessage message;
@@ -225,7 +226,7 @@ TEST_F(BusTest, WhatASenderSendsBeyondWhatMayWaitIsRefused) {
   flood(busy, kMaxOpenRequests, "busy");
   const std::string megabyte(1 * kMiB, 'a');
 
-  // The bus hands on all of it; none is delivered while the first requests are open.
+  // The bus forwards all of them. None is delivered while the first requests are open.
   for (int call = 0; call < 6; ++call) {
     BusMessage message;
     sd_bus_message_new_method_call(busy.get(), message.out(), kName, kTestPath, kTestInterface,

@@ -51,12 +51,12 @@ void ClientConnection::resume() {
 }
 
 void ClientConnection::deliver() {
-  // The delegate has not said yet whether it wants this client.
+  // The delegate has not yet accepted or refused this client.
   if (state_ == State::kNotResumed) setReading(false);
   if (state_ == State::kNotResumed || state_ == State::kEnded) return input().settle();
   state_ = State::kReading;
-  // While too much waits for the store, a client that has more than a short share waits until the
-  // store has caught up. Clients that send little are not slowed down.
+  // While too many messages wait for the store, a client that has more than a short share waits
+  // until the store has caught up. Clients that send little are not slowed down.
   const bool pressed = host_.backpressure().isHigh();
   std::size_t requestsLeft = pressed ? kShortTurnRequests : host_.turn().requestsPerClient();
   std::size_t bytes = 0;
@@ -66,11 +66,12 @@ void ClientConnection::deliver() {
       onDelivered(next.state == FrameBuffer::State::kPartial, bytes > 0);
       break;
     }
-    // Only with a whole frame: a client without a request need not be held back. Before the share,
-    // because a client that is due would be looked at in every turn although it must wait.
+    // Test this only with a whole frame: a client without a request need not wait. Test it before
+    // the share: a client that is due is visited in every turn, which is useless while it must
+    // wait.
     if (mustWait()) break;
-    // Looks at what was delivered before this frame, so that a frame larger than a whole share is
-    // delivered too.
+    // Count only what was delivered before this frame: a frame that is larger than a whole share
+    // must be delivered, too.
     if (requestsLeft == 0 || bytes >= kTurnBytes) {
       pressed ? waitInState(State::kWaitingForRelief) : becomeDue();
       break;
@@ -80,7 +81,7 @@ void ClientConnection::deliver() {
     bytes += next.totalBytes;
     --requestsLeft;
   }
-  // In every turn: the next client reads into the same scratch.
+  // Needed in every turn: the next client reads into the same scratch.
   input().settle();
 }
 
@@ -98,14 +99,15 @@ ClientConnection::Step ClientConnection::deliverFrame(const FrameBuffer::Next& n
     onMalformed(error->message + " at byte " + std::to_string(error->offset));
     return Step::kStop;
   }
-  // The delivery queues jobs. Only a batch lets this thread run them, and wakes the pool once.
+  // A delivery queues jobs. Only inside a batch can this thread run them itself and wake the pool
+  // once for all.
   host_.turn().beforeDelivery();
   host_.dispatcher().dispatch(*this, std::get<dbus::Frame>(read), next.totalBytes);
   return hasEnded() ? Step::kStop : Step::kGoOn;
 }
 
-// Reads the header alone, as that of a message without a body, to find out what to answer. The body
-// is dropped as it arrives and never held in memory.
+// Reads only the header, as if the message had no body, to find out what to answer. The body is
+// dropped as it arrives and never kept in memory.
 void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
   const std::vector<std::byte> header = FrameBuffer::withoutBody(next);
   const std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(header);
@@ -113,7 +115,7 @@ void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
     return onMalformed(error->message + " at byte " + std::to_string(error->offset));
   }
   const dbus::MessageHeader& request = std::get<dbus::Frame>(read).header;
-  // Nobody waits for an answer to anything else.
+  // Only calls have an answer.
   if (request.type != dbus::MessageType::kMethodCall) return;
   host_.statistics().requestsReceived.add();
   refuse(request, Refusal::kTooLarge, error_names::kLimitsExceeded,
@@ -122,7 +124,8 @@ void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
 }
 
 bool ClientConnection::mustWait() {
-  // wait() is false if requests have been carried out in between: nobody would wake this client.
+  // wait() returns false if requests have been completed in between. This client would then not be
+  // woken, and must go on.
   if (link_->flow().isFull() && link_->flow().wait()) {
     waitInState(State::kWaitingForRoom);
     return true;
@@ -157,7 +160,8 @@ void ClientConnection::onRelief() {
 void ClientConnection::onOutputRoom() {
   if (state_ != State::kWaitingForReader) return;
   const OutputQueue& output = stream().output();
-  // The gap to the bound keeps a slow reader from stopping and starting with each reply.
+  // The gap between this and the bound keeps a slow reader from stopping and starting with each
+  // reply.
   if (output.unsentFrames() > kMaxUnreadReplies / 2) return;
   if (output.unsentBytes() > kMaxUnreadReplyBytes / 2) return;
   becomeDue();
@@ -167,14 +171,15 @@ void ClientConnection::end(Why why) {
   if (state_ == State::kEnded) return;
   state_ = State::kEnded;
   why_ = why;
-  // The handlers are called in the next turn: end() may be called from within a delivery, whose
-  // replies still have to leave.
+  // The handlers run in the next turn, because end() may be called during a delivery whose replies
+  // still have to be sent.
   onEnded();
   host_.turn().finishNext(shared_from_this());
 }
 
 void ClientConnection::finish() {
-  // The port promises this order, and an interruption only if the other side ended the connection.
+  // The port promises this order. It promises an interruption only if the other side has ended the
+  // connection.
   if (why_ == Why::kPeerVanished && interruptionHandler_) interruptionHandler_();
   if (invalidationHandler_) invalidationHandler_();
   if (unloggedRefusals_ > 0) {
@@ -194,7 +199,8 @@ void ClientConnection::abandon() {
 }
 
 void ClientConnection::letGo() {
-  // First: what is released below can answer requests, and those replies must not come back here.
+  // Detach first: the objects that are released below can answer requests, and those replies must
+  // not come back here.
   link_->detach();
   interruptionHandler_ = nullptr;
   invalidationHandler_ = nullptr;

@@ -63,8 +63,8 @@ class ClientConnection : public NSXPCConnection,
   void end(Why why);
   // Calls the handlers and releases everything. Called by the schedule.
   void finish();
-  // Releases everything without calling the handlers: the delegate refused the connection, or the
-  // service ends.
+  // Releases everything without calling the handlers, because the delegate has refused the
+  // connection or the service ends.
   void abandon();
 
   // For the code that answers requests.
@@ -80,12 +80,12 @@ class ClientConnection : public NSXPCConnection,
   // reply.
   void refuse(const dbus::MessageHeader& request, Refusal reason, std::string_view errorName,
               const std::string& text);
-  // The client broke the rules of the wire. `what` says how and at which byte.
+  // The client broke the rules of the wire. `what` describes how and at which byte.
   virtual void onMalformed(const std::string& what);
 
   // True for a client on our own socket. It has no bus, so the service answers calls to the bus.
   [[nodiscard]] virtual bool isPeerToPeer() const = 0;
-  // True at the first call. A client must say Hello to the bus exactly once.
+  // Returns true only at the first call: a client must send Hello to the bus exactly once.
   [[nodiscard]] bool takeHello();
 
  protected:
@@ -93,7 +93,7 @@ class ClientConnection : public NSXPCConnection,
   [[nodiscard]] virtual SocketStream& stream() = 0;
   // The bus name of the client; empty without a bus.
   [[nodiscard]] virtual std::string_view replyDestination() const = 0;
-  // Whether more input is wanted.
+  // Says whether this client wants more input.
   virtual void setReading(bool reading) = 0;
   // All whole frames have been delivered. `begun`: part of another frame is there. `progress`: at
   // least one frame was delivered this time.

@@ -16,7 +16,7 @@ namespace halvox::platform::linux_ {
 class ClientConnection;
 
 // What requests and replies share with their client's connection. They can outlive the connection,
-// and other threads hold them, so they must not refer to the connection itself.
+// and other threads hold them. They must therefore not refer to the connection itself.
 //
 //   attached (the connection exists) --detach()--> detached: replies are dropped and counted
 //

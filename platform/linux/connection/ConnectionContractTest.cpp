@@ -1,4 +1,4 @@
-// The contract of connections, kept by the adapter on its own socket.
+// Tests the contract of connections on the adapter with its own socket.
 
 #include "platform/fake/contracts/ConnectionContract.h"
 
@@ -19,7 +19,7 @@ using linux_::BusMessage;
 using linux_::ConnectionOptions;
 using linux_::LinuxConnectionService;
 
-// A client on the systemd library.
+// A client that uses the systemd library.
 class LinuxClient {
  public:
   // A client that the service refuses has no connection.
@@ -74,7 +74,7 @@ class LinuxClient {
   std::unique_ptr<BusClient> client_;
 };
 
-// The service on a thread of its own.
+// The service, which runs on a thread of its own.
 class LinuxHarness {
  public:
   using Client = LinuxClient;

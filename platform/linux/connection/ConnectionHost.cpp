@@ -32,8 +32,8 @@ std::string hexOf(const sd_id128_t& id) {
 ServiceIdentity makeIdentity(const std::string& busName) {
   ServiceIdentity identity{.guidHex = {}, .busName = busName, .machineHex = {}};
   sd_id128_t id;
-  // Clients use the GUID to recognise a server that they know already. Without random numbers zeros
-  // will do, since the handshake only needs 32 digits.
+  // Clients use the GUID to recognise a server that they already know. If there are no random
+  // numbers, use zeros: the handshake only needs 32 digits.
   identity.guidHex = sd_id128_randomize(&id) >= 0 ? hexOf(id) : std::string(32, '0');
   if (sd_id128_get_machine(&id) >= 0) identity.machineHex = hexOf(id);
   return identity;
@@ -62,8 +62,9 @@ ConnectionHost::ConnectionHost(ConnectionOptions options, Backpressure& backpres
       messages_(options_.messageTimeout),
       acceptRetries_(kAcceptRetryDelay),
       turn_(options_.beginBatch, options_.endBatch, options_.afterReplies) {
-  // In the constructor: threads inherit the mask, and a thread that was started before would be
-  // killed by the signal that the loop waits for.
+  // Block the signals in the constructor, because threads inherit the mask. A thread that was
+  // started earlier would receive the signal that the loop waits for, and the signal would kill the
+  // process.
   if (options_.signals == EndSignals::kHandle) SignalWatch::block();
   backpressure_.setReliefHandler([inbox = inbox_] { inbox->postRelief(); });
 }
@@ -90,8 +91,8 @@ Result<void, ConnectionOpenError> ConnectionHost::openLoop() {
 }
 
 Result<void, ConnectionOpenError> ConnectionHost::openSockets() {
-  // A passed socket and its file belong to systemd. This binds no other one, and removes no file at
-  // the end.
+  // A passed socket and its file belong to systemd. The service then makes no socket of its own,
+  // and removes no file at the end.
   auto sockets = passedSockets();
   if (!sockets) return std::move(sockets).error();
   if (sockets->empty()) {
@@ -111,14 +112,14 @@ Result<void, ConnectionOpenError> ConnectionHost::openSockets() {
 Result<void, ConnectionOpenError> ConnectionHost::openBuses() {
   const std::optional<StarterBus>& starter = options_.starter;
   const bool wantsBus = options_.bus != BusKind::kNone;
-  // One bus is joined once: it gives a name to one connection only.
+  // Join each bus only once: it gives a name to one connection only.
   const bool isStartersBus = wantsBus && starter.has_value() && starter->kind == options_.bus;
   if (wantsBus) {
     auto joined = joinBus(isStartersBus ? starter->address : busAddressOf(options_.bus));
     if (!joined) return joined;
   }
   if (!starter.has_value() || isStartersBus) return {};
-  // Not the end of the start: a terminal that a bus has started hands the variables on to every
+  // This does not fail the start. A terminal that a bus has started passes these variables to every
   // program in it, where they may be wrong.
   if (const auto joined = joinBus(starter->address); !joined) {
     kLog.error("cannot join the bus that started the service: ", joined.error().message,
@@ -142,7 +143,7 @@ void ConnectionHost::resume() {
         "resume() was called before open() succeeded or without a delegate; serving nothing");
     return;
   }
-  // Before the first turn: replies that are given on this thread must not go through the mail.
+  // Set before the first turn: replies that are given on this thread must not go through the mail.
   inbox_->attachToThisThread();
   for (const auto& bus : buses_) bus->start();
   kLog.info("serving ", listeners_.size(), " sockets and ", buses_.size(), " buses");
@@ -159,14 +160,15 @@ void ConnectionHost::takeTurn() {
   turn_.begin();
   const std::size_t ready =
       loop_.runOnce(sleeps ? EventLoop::Wait::kBlock : EventLoop::Wait::kPoll);
-  // Before anything else, so that posts of this turn save their system call.
+  // Note this before anything else: posts during this turn then need no system call.
   if (sleeps) inbox_->awake();
-  // After the events: a message that has just come to its end in time is not late.
+  // Check the deadlines after the events: a message that has just arrived completely is in time.
   expireDeadlines();
   turn_.deliver(ready);
   turn_.finishEnded();
   turn_.endDeliveries();
-  // After the batch and before the writes: replies of other threads leave together with ours.
+  // Read the mail after the batch and before the writes: replies of other threads then leave
+  // together with ours.
   readMail();
   turn_.flush();
   turn_.reap();
@@ -184,7 +186,7 @@ std::optional<DeadlineQueue::Clock::time_point> ConnectionHost::firstDeadline() 
 }
 
 void ConnectionHost::expireDeadlines() {
-  // Saves reading the clock in most turns.
+  // Avoids reading the clock in most turns.
   if (!firstDeadline().has_value()) return;
   const auto now = DeadlineQueue::Clock::now();
   for (DeadlineQueue* queue : {&handshakes_, &messages_, &acceptRetries_}) queue->expire(now);
@@ -207,7 +209,8 @@ void ConnectionHost::readMail() {
 void ConnectionHost::acceptPeer(UniqueFd fd, const PeerCredentials& credentials) {
   auto peer =
       std::make_shared<PeerConnection>(*this, nextClientNumber(), std::move(fd), credentials);
-  // Before the delegate is asked: a peer that it refuses removes itself from the map.
+  // Add it before asking the delegate: a peer that the delegate refuses removes itself from the
+  // map.
   peers_.emplace(peer.get(), peer);
   peer->start();
   static_cast<void>(admit(peer));
@@ -226,16 +229,17 @@ bool ConnectionHost::admit(const std::shared_ptr<ClientConnection>& client) {
 
 void ConnectionHost::peerClosed(PeerConnection& peer) {
   peers_.erase(&peer);
-  // Accepting may wait for the descriptor that is free now.
+  // Accepting may be paused until a descriptor is free, and one is free now.
   for (const auto& listener : listeners_) listener->tryAgain();
 }
 
 // May be called again, and after an open() that failed half-way.
 void ConnectionHost::shutDown() {
-  // First: what is released below posts its replies and its room, which nobody will read.
+  // Close the inbox first: the objects that are released below post replies and notices of room
+  // that will not be read.
   inbox_->close();
   turn_.clear();
-  // Out of the map first, because an abandoned peer removes itself from it.
+  // Empty the map first, because an abandoned peer removes itself from it.
   const auto peers = std::exchange(peers_, {});
   for (const auto& [key, peer] : peers) peer->abandon();
   for (const auto& bus : buses_) bus->abandon();

@@ -71,7 +71,7 @@ class ConnectionHost final : public NSXPCListener {
   [[nodiscard]] DeadlineQueue& messages() { return messages_; }
   [[nodiscard]] DeadlineQueue& acceptRetries() { return acceptRetries_; }
 
-  // A client has connected. Both ask the delegate. False when it refused.
+  // A client has connected. Both ask the delegate, and return false if it refuses the client.
   void acceptPeer(UniqueFd fd, const PeerCredentials& credentials);
   [[nodiscard]] bool admit(const std::shared_ptr<ClientConnection>& client);
   // The numbers of clients: 1, 2, ...

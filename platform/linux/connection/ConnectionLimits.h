@@ -5,7 +5,8 @@
 #include <cstdint>
 
 // The bounds that the connection adapter keeps for each client and for each turn of its loop. They
-// are constants, not settings: they bound memory and fairness, and no client can tell them apart.
+// are constants, not settings: they bound memory and fairness, and clients do not notice their
+// values.
 namespace halvox::platform::linux_ {
 
 inline constexpr std::size_t kKiB = 1024;
@@ -31,18 +32,19 @@ inline constexpr std::size_t kMaxWaitingBytesOfSender = 4 * kMiB;
 
 // The size of one read. Frames larger than this get a buffer of their own.
 inline constexpr std::size_t kReadBytes = 64 * kKiB;
-// A client's share of one turn. What exceeds it waits until the other clients had theirs.
+// A client's share of one turn. What exceeds it waits until the other clients have had theirs.
 inline constexpr std::size_t kTurnRequests = 64;
 inline constexpr std::size_t kTurnBytes = 64 * kKiB;
-// The share when more than kFewClients clients have requests, and while too much waits for the
-// store. A turn must not grow with the number of clients, since every reply of a turn waits for its
-// end.
+// The share if more than kFewClients clients have requests, and while too many messages wait for
+// the store. A turn must not grow with the number of clients, because all replies of a turn wait
+// for its end.
 inline constexpr std::size_t kShortTurnRequests = 16;
 inline constexpr std::size_t kFewClients = 4;
 
 inline constexpr int kEventsPerTurn = 64;
 inline constexpr int kAcceptsPerTurn = 64;
-// How long accepting pauses when descriptors ran out and no connection of ours ends.
+// How long accepting pauses after descriptors have run out, unless a connection of ours ends
+// earlier.
 inline constexpr std::chrono::milliseconds kAcceptRetryDelay{1000};
 
 }  // namespace halvox::platform::linux_

@@ -11,7 +11,7 @@ namespace halvox::platform::linux_ {
 
 class DeadlineQueue;
 
-// Is called when something took too long.
+// The owner of a Deadline, which is called when the deadline has passed.
 class DeadlineOwner {
  public:
   virtual ~DeadlineOwner() = default;
@@ -39,8 +39,8 @@ class Deadline {
   std::chrono::steady_clock::time_point at_;
 };
 
-// Deadlines with the same delay. The one that started first is therefore the first one due, so a
-// linked list keeps the order, and starting or stopping a deadline takes constant time: every
+// Deadlines with the same delay. The deadline that started first is therefore due first, and a
+// linked list keeps the order. Starting or stopping a deadline takes constant time, because every
 // request of every client may do both. Does not own the deadlines. Belongs to one thread.
 class DeadlineQueue {
  public:
@@ -67,17 +67,17 @@ class DeadlineQueue {
   Deadline* last_ = nullptr;
 };
 
-// The timer of a loop. It is set only while something can become due, because an idle service makes
-// no wake-ups. Belongs to the loop's thread.
+// The timer of a loop. It is set only while something can become due, because an idle service must
+// not wake up. Belongs to the loop's thread.
 class LoopTimer final : public EventSource {
  public:
   enum class Before : std::uint8_t { kSleep, kNextTurn };
 
   // False when the system gave no timer.
   [[nodiscard]] bool open(EventLoop& loop);
-  // Makes the loop wake up at `due`. A timer that is set too early is left as it is, which saves a
-  // system call for most requests: it is set again when it expires. A timer that nobody needs is
-  // disabled before the loop sleeps.
+  // Makes the loop wake up at `due`. A timer that is set too early stays as it is until it expires
+  // and is set again. This saves a system call for most requests. A timer that is not needed any
+  // more is disabled before the loop sleeps.
   void arrange(std::optional<std::chrono::steady_clock::time_point> due, Before before);
   void onReady(std::uint32_t events) override;
 

@@ -15,11 +15,11 @@ class EventSource {
   virtual void onReady(std::uint32_t events) = 0;
 };
 
-// Waits for descriptors to become ready (epoll, level-triggered). A source that does not read all
-// that is there is called again in the next turn, after the others, so one busy client cannot
-// starve them. Idle descriptors cost nothing. Belongs to one thread. Does not own the sources. A
-// source must exist until the end of the turn in which it was forgotten: an event for it may
-// already have been fetched.
+// Waits for descriptors to become ready (epoll, level-triggered). A source that does not read
+// everything is called again in the next turn, after the others: one busy client cannot starve
+// them. Idle descriptors cost nothing. Belongs to one thread. Does not own the sources. A source
+// must exist until the end of the turn in which it was removed: an event for it may already have
+// been fetched.
 class EventLoop {
  public:
   enum class Wait : std::uint8_t { kBlock, kPoll };

@@ -9,8 +9,8 @@
 namespace halvox::platform::linux_ {
 
 // Counts the open requests of one client, so that its reader can pause until they are carried out.
-// A flood then slows down the client that sends it, and memory stays bounded. ConnectionLimits.h
-// has the bounds.
+// A flood of requests then slows down only the client that sends it, and memory stays bounded.
+// ConnectionLimits.h has the bounds.
 //
 //   below --open()--> full --wait()--> waiting --close() reaches half--> below, the reader is woken
 //
@@ -25,11 +25,11 @@ class FlowControl {
 
   void open(Cost cost) { open_.fetch_add(packed(cost), std::memory_order_relaxed); }
 
-  // True when the reader waits and has room again. The caller must then wake it. Of several
+  // Returns true if the reader waits and has room again. The caller must then wake it. Of several
   // callers, only one gets true.
   [[nodiscard]] bool close(Cost cost) {
-    // Sequentially consistent with wait(): whichever of the two comes second sees what the first
-    // did, so the reader cannot sleep for ever.
+    // Sequentially consistent with wait(): the later of the two sees what the earlier one did. The
+    // reader therefore cannot sleep forever.
     const std::uint64_t left = open_.fetch_sub(packed(cost)) - packed(cost);
     return hasRoomAgain(left) && waiting_.load() && waiting_.exchange(false);
   }
@@ -39,7 +39,7 @@ class FlowControl {
     return requestsIn(open) >= kMaxOpenRequests || bytesIn(open) >= kMaxOpenRequestBytes;
   }
 
-  // Asks to be woken when there is room again. False when there is room already.
+  // Asks for a wake-up when there is room again. Returns false if there already is room.
   [[nodiscard]] bool wait() {
     waiting_.store(true);
     return !(hasRoomAgain(open_.load()) && waiting_.exchange(false));
@@ -48,8 +48,8 @@ class FlowControl {
   [[nodiscard]] std::size_t openRequests() const { return requestsIn(open_.load()); }
 
  private:
-  // Both sums in one word, so that one atomic operation changes both: the number of requests in the
-  // low 24 bits, the bytes above. Flow control keeps both far below their width.
+  // Both sums are in one word, and one atomic operation changes both. The low 24 bits are the
+  // number of requests, the others are the bytes. Flow control keeps both far below their width.
   static constexpr unsigned kRequestBits = 24;
 
   static std::uint64_t packed(Cost cost) {

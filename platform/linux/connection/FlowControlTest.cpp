@@ -56,7 +56,7 @@ TEST(FlowControlTest, WaitingIsRefusedWhenThereIsRoom) {
   EXPECT_FALSE(flow.wait());
 }
 
-// Whichever comes second, the wait or the last close, must see the other.
+// The later one of the wait and the last close must see the earlier one.
 TEST(FlowControlTest, NoWakeUpIsLostBetweenThreads) {
   for (int round = 0; round < 20'000; ++round) {
     FlowControl flow;

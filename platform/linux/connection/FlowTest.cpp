@@ -15,7 +15,7 @@ namespace {
 
 constexpr std::uint32_t kManyCalls = 3000;
 
-// Calls that are answered when the test says so.
+// Calls that the service answers only when the test releases them.
 std::string manyCalls(RawClient& client, std::string_view member) {
   const std::array argument = {Value(std::int64_t{1})};
   std::string calls;
@@ -43,7 +43,7 @@ bool stopReading(RawClient& client, const ServiceUnderTest& service) {
   });
 }
 
-// Lets the object answer what is open, again and again, until every call has its answer.
+// Lets the object answer the open calls, repeatedly, until every call has its answer.
 void answerUntilAllAreRead(TestObject& object, RawClient& client) {
   const std::jthread answering([&](const std::stop_token& stop) {
     while (!stop.stop_requested()) object.answerBusy();
@@ -64,7 +64,7 @@ TEST(FlowTest, ClientIsNotReadFromWhileItHasTheMostOpenRequests) {
   const std::jthread writer([&] { client.send(manyCalls(client, "busy")); });
 
   ASSERT_TRUE(eventually([&] { return object.delivered == kMaxOpenRequests; }));
-  // Others go on, and in all the turns that they take not one more is delivered.
+  // Other clients continue. In all their turns, no further request of the full client is delivered.
   for (int call = 0; call < 50; ++call) ASSERT_EQ(other.call("echo", "a").text, "a");
 
   EXPECT_EQ(object.delivered, kMaxOpenRequests + 50);
@@ -108,7 +108,7 @@ TEST(FlowTest, ClientThatDoesNotReadIsNotReadFromAndLosesNothing) {
     client.send(calls);
   });
 
-  // It comes to a stand when the socket's buffers are full; until then it reads nothing.
+  // The client reads nothing. The service stops reading from it when the socket's buffers are full.
   ASSERT_TRUE(eventually([&] { return object.delivered > kMaxUnreadReplies; }));
   for (int call = 0; call < 200; ++call) ASSERT_EQ(other.call("echo", "a").text, "a");
   EXPECT_LT(object.delivered, kCalls / 2);

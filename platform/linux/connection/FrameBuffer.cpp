@@ -25,9 +25,9 @@ std::size_t headerBytes(std::span<const std::byte> frame) {
 }  // namespace
 
 std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
-  // What is unused is always the end of own_. Everything before it was used up.
+  // The unused bytes are always at the end of own_. Everything before them has been used.
   if (const std::size_t wanted = bytesThatDoNotFitScratch(); wanted > 0) {
-    // Doubles what has arrived instead of trusting the size that the header claims.
+    // Allocate twice what has arrived instead of trusting the size in the header.
     const std::size_t offset = own_.size() - view_.size();
     const std::size_t grow = std::min(wanted, std::max(view_.size(), kReadBytes));
     own_.erase(own_.begin(), own_.begin() + static_cast<std::ptrdiff_t>(offset));
@@ -38,7 +38,8 @@ std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
     return readSpan_;
   }
   const std::span<std::byte> bytes = scratch.bytes();
-  // A frame that was cut by the last read must be contiguous with its rest to be decoded in place.
+  // If the last read ended inside a frame, the rest must follow it in memory: frames are decoded in
+  // place.
   if (!view_.empty()) std::memcpy(bytes.data(), view_.data(), view_.size());
   view_ = bytes.first(view_.size());
   inScratch_ = true;
@@ -47,7 +48,7 @@ std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
 }
 
 void FrameBuffer::received(std::size_t count) {
-  // Gives back what readInto() added for bytes that did not come. Does not move what is there.
+  // Removes what readInto() added for bytes that did not arrive. Does not move the other bytes.
   if (!inScratch_) own_.resize(view_.size() + count);
   const std::byte* start = inScratch_ ? readSpan_.data() - view_.size() : own_.data();
   view_ = {start, view_.size() + count};
@@ -70,7 +71,8 @@ void FrameBuffer::settle() {
 
 void FrameBuffer::append(std::span<const std::byte> bytes) {
   const std::size_t usedUp = own_.size() - view_.size();
-  // Erasing moves the rest. From one half on, each byte is moved at most once on average.
+  // Erasing moves the rest. Erasing only when at least half is used moves each byte at most once on
+  // average.
   if (usedUp > own_.size() / 2) {
     own_.erase(own_.begin(), own_.begin() + static_cast<std::ptrdiff_t>(usedUp));
   }
@@ -85,8 +87,8 @@ FrameBuffer::Next FrameBuffer::next() const {
     next.state = skip_ > 0 ? State::kPartial : State::kEmpty;
     return next;
   }
-  // With the limit of D-Bus and not ours: a frame between the two is answered with an error and
-  // skipped, and the connection continues.
+  // Use the limit of D-Bus here and not our lower one. A frame between the two limits is answered
+  // with an error and skipped, and the connection continues.
   dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);
   next.state = State::kPartial;
   if (measure.state == dbus::FrameMeasure::State::kNeedMoreBytes) return next;
@@ -118,7 +120,7 @@ FrameBuffer::Next FrameBuffer::next() const {
 
 void FrameBuffer::consume(std::size_t count) {
   const std::size_t present = std::min(count, view_.size());
-  // Of a frame over the limit, most bytes are still on their way.
+  // Most bytes of a frame over the limit have not arrived yet.
   skip_ += count - present;
   view_ = view_.subspan(present);
 }
@@ -129,8 +131,8 @@ std::vector<std::byte> FrameBuffer::withoutBody(const Next& oversized) {
   return frame;
 }
 
-// Above 0 when the next read must go to storage of its own: the missing bytes of a large frame, or
-// the size of one read if more is left over than the scratch has room for.
+// Above 0 if the next read must not go to the scratch. It is then the number of missing bytes of a
+// large frame, or the size of one read if the scratch has no room for what is left over.
 std::size_t FrameBuffer::bytesThatDoNotFitScratch() const {
   if (view_.size() >= dbus::kFrameStartBytes) {
     const dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);

@@ -11,9 +11,9 @@
 
 namespace halvox::platform::linux_ {
 
-// The memory into which all connections read, one after the other. One for all, because a buffer
-// for each connection would cost 128 KiB for each idle client, and because it stays in the cache.
-// It has room for what one connection has left over and for one more read. Owned by the host.
+// The memory into which all connections read, one after the other. They share one because a buffer
+// for each would cost 128 KiB for each idle client, and because one buffer stays in the cache. It
+// has room for what one connection has left over and for one more read. Owned by the host.
 class ReadScratch {
  public:
   ReadScratch() : bytes_(std::make_unique_for_overwrite<std::byte[]>(kBytes)) {}
@@ -24,15 +24,15 @@ class ReadScratch {
   std::unique_ptr<std::byte[]> bytes_;
 };
 
-// What one connection has received and not used up, cut into frames.
+// What one connection has received and not yet used, cut into frames.
 //
 //   readInto() --> read(2) --> received() --> next(), consume() ... --> settle()
 //
 // Frames are decoded in place, in the shared scratch. settle() copies what is left over to storage
-// of its own, which in most turns is nothing. An idle connection holds no storage. A frame larger
-// than a read gets storage that grows with the bytes that have arrived, not with the size that the
-// header claims: a client cannot reserve memory by announcing a large frame. Belongs to one thread.
-// Owned by its connection.
+// of its own. In most turns nothing is left over. An idle connection holds no storage. A frame
+// larger than a read gets storage that grows with the bytes that have arrived, not with the size
+// that the header claims: a client cannot reserve memory by announcing a large frame. Belongs to
+// one thread. Owned by its connection.
 class FrameBuffer {
  public:
   enum class State : std::uint8_t {
@@ -53,7 +53,7 @@ class FrameBuffer {
   FrameBuffer(const FrameBuffer&) = delete;
   FrameBuffer& operator=(const FrameBuffer&) = delete;
 
-  // Where the next read goes. Call received() after it, also when nothing came. Nothing else may
+  // Where the next read goes. Call received() after it, even if nothing arrived. Nothing else may
   // use the scratch before settle().
   [[nodiscard]] std::span<std::byte> readInto(const ReadScratch& scratch);
   void received(std::size_t count);
@@ -63,11 +63,11 @@ class FrameBuffer {
   // Adds bytes from elsewhere. Not between readInto() and settle().
   void append(std::span<const std::byte> bytes);
 
-  // All bytes that are not used up, whether or not they are a frame.
+  // All unused bytes, whether or not they are a frame.
   [[nodiscard]] std::span<const std::byte> unused() const { return view_; }
   // What comes next. Points into this buffer: valid until it is changed.
   [[nodiscard]] Next next() const;
-  // Uses up bytes; those that have not arrived yet are dropped when they do.
+  // Marks bytes as used. Those that have not arrived yet are dropped when they arrive.
   void consume(std::size_t count);
 
   // The header of a kOversized frame as a frame of its own, one without a body.

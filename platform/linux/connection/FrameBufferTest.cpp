@@ -24,7 +24,7 @@ std::string callWithText(std::size_t textBytes) {
 
 class FrameBufferTest : public testing::Test {
  protected:
-  // Lets as much arrive as one read takes; returns how much that was.
+  // Simulates one read. Returns how many bytes it took.
   std::size_t arrive(std::string_view bytes) {
     const std::span<std::byte> room = buffer_.readInto(scratch_);
     const std::size_t count = std::min(room.size(), bytes.size());

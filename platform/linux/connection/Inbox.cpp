@@ -38,8 +38,8 @@ void Inbox::post(const Add& add) {
   }
   if (!mustWake) return;
   const std::uint64_t one = 1;
-  // After the lock is released: the loop wakes at once and takes it. The write cannot fail: it
-  // happens once for each sleep, so the counter never fills up.
+  // Write after the lock is released: the loop wakes up at once and takes the lock. The write
+  // cannot fail: it happens once for each sleep, and the counter therefore never fills up.
   static_cast<void>(write(event_.get(), &one, sizeof one));
 }
 
@@ -66,7 +66,7 @@ bool Inbox::isLoopThread() const {
 void Inbox::attachToThisThread() { loopThread_ = std::this_thread::get_id(); }
 
 void Inbox::close() {
-  // From now on this thread posts like any other, and finds the inbox closed.
+  // From now on this thread posts like any other thread, and its posts find the inbox closed.
   loopThread_ = std::thread::id();
   Mail dropped;  // destroyed after the lock is released: what it holds may post again
   const MutexLock lock(mutex_);
@@ -76,8 +76,8 @@ void Inbox::close() {
 
 bool Inbox::trySleep() {
   const MutexLock lock(mutex_);
-  // In one critical section with the flag: a post is either seen here or sees that it must wake the
-  // loop.
+  // Look at the mail and set the flag in one critical section. Either this sees a post, or the post
+  // sees that it must wake the loop.
   if (!mail_.isEmpty()) return false;
   sleeping_ = true;
   return true;

@@ -41,8 +41,8 @@ struct Mail {
 //
 // A post while the I/O thread is awake costs a lock and no system call: it reads its mail at the
 // end of every turn. Only the first post while it sleeps wakes it. Shared by the service and by
-// replies and requests, which may outlive it. The number of letters is bounded by what is open: one
-// reply a request, one notice of room a client.
+// replies and requests, which may outlive it. The number of letters is bounded: at most one reply
+// for each open request and one notice of room for each client.
 class Inbox final : public EventSource {
  public:
   Inbox();
@@ -60,7 +60,8 @@ class Inbox final : public EventSource {
   // On the I/O thread.
   void attachToThisThread();
   void close();
-  // Announces that the loop is about to sleep. False when there is mail: it must not sleep.
+  // Announces that the loop is about to sleep. Returns false if there is mail: the loop must then
+  // not sleep.
   [[nodiscard]] bool trySleep();
   void awake();
   // Swaps the mail with `into`, which must be empty. Swapping keeps the capacity of both sides.

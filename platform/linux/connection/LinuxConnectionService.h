@@ -40,8 +40,8 @@ struct ConnectionOptions {
   bool makeSocketDirectory = false;
   BusKind bus = BusKind::kNone;  // open() fails if it cannot be joined
   // The bus that started the service. It is joined too, unless it is `bus`. A failure is only
-  // logged: a process inherits this from whatever a bus has started, so it may have nothing to do
-  // with us.
+  // logged: the value is inherited from any process that a bus has started, and that bus may not be
+  // meant for the service.
   std::optional<StarterBus> starter;
   std::string busName = "com.tarno.halvox.reporting";
   std::chrono::milliseconds handshakeTimeout{defaults::kHandshakeTimeout};
@@ -49,12 +49,12 @@ struct ConnectionOptions {
   std::uint64_t clientHistoryMegabytes = defaults::kClientHistoryMegabytes;  // 2^20 bytes each
   std::uint64_t clientSessions = defaults::kClientSessions;
   std::uint64_t messageReporterIDs =
-      defaults::kMessageReporterIDs;  // how many one request may name
+      defaults::kMessageReporterIDs;  // the most that one request may name
   std::size_t maxFrameBytes = 32 * kMiB;
   EndSignals signals = EndSignals::kHandle;
   // Called on the I/O thread: before the first delivery of a turn, after the last one, and after
   // the replies of the turn have been written. Replies given on this thread during `endBatch` are
-  // among them. They connect the loop to the queues, which it does not know.
+  // among them. They connect the loop to the queues, about which the loop itself knows nothing.
   std::function<void()> beginBatch;
   std::function<void()> endBatch;
   std::function<void()> afterReplies;
@@ -91,9 +91,9 @@ enum class ConnectionOpenError : std::uint8_t {
 // handlers of open connections are not called. Owned by the platform.
 class LinuxConnectionService final : public ConnectionService {
  public:
-  // Must be made before the first thread starts, because threads inherit the mask that it sets: the
-  // signals are blocked everywhere and read by the loop. Sets the relief handler of `backpressure`,
-  // which must outlive it. The platform's services must be installed before open().
+  // Construct it before the first thread starts. It blocks the signals that the loop reads, and
+  // threads inherit the mask. Sets the relief handler of `backpressure`, which must outlive it. The
+  // platform's services must be installed before open().
   LinuxConnectionService(ConnectionOptions options, Backpressure& backpressure);
   LinuxConnectionService(const LinuxConnectionService&) = delete;
   LinuxConnectionService& operator=(const LinuxConnectionService&) = delete;

@@ -59,16 +59,17 @@ bool ListeningSocket::acceptOne() {
   const bool noDescriptors =
       error == EMFILE || error == ENFILE || error == ENOBUFS || error == ENOMEM;
   if (noDescriptors) waitForDescriptors(error);
-  // Any other error but that of an empty backlog concerns one connection only. Try the next one.
+  // Any other error, except that of an empty backlog, concerns only one connection. Try the next
+  // one.
   return !noDescriptors && error != EAGAIN && error != EINVAL && error != EBADF;
 }
 
 void ListeningSocket::waitForDescriptors(int error) {
-  // The backlog stays readable, so a level-triggered loop would spin.
+  // The socket stays readable, and a level-triggered loop would spin.
   host_.loop().forget(fd_.get());
   isWaiting_ = true;
   host_.acceptRetries().start(retry_);
-  // One line for each shortage, and not one a second.
+  // Log one line for each shortage, not one every second.
   if (std::exchange(isShort_, true)) return;
   host_.statistics().acceptPauses.add();
   kLog.error("cannot accept connections (", errnoText(error),

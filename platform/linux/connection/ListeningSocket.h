@@ -27,13 +27,13 @@ class ListeningSocket final : public EventSource, private DeadlineOwner {
 
   // False when the socket cannot be watched.
   [[nodiscard]] bool start();
-  // A connection of ours has closed its descriptor.
+  // One of our connections has closed its descriptor.
   void tryAgain();
   void onReady(std::uint32_t events) override;
 
  private:
   void onDeadline() override { tryAgain(); }
-  // False when nothing more can be accepted now.
+  // Returns false if no more connections can be accepted now.
   bool acceptOne();
   void waitForDescriptors(int error);
 

@@ -13,7 +13,7 @@ namespace {
 constexpr std::size_t kSpareBuffers = 16;
 constexpr std::size_t kMaxSpareBytes = 256 * kKiB;
 // Sent bytes are removed from the front of a buffer when they are at least this many and at least
-// half of it: removing moves the rest, which must not happen for every partial write.
+// half of it: removing them moves the rest, which must not happen after every partial write.
 constexpr std::size_t kCompactBytes = 64 * kKiB;
 
 }  // namespace
@@ -51,7 +51,7 @@ std::size_t OutputQueue::unsentBytes() const {
 }
 
 OutputQueue::Flush OutputQueue::flush(int fd, std::size_t& sentBytes, std::size_t& droppedFrames) {
-  // Everything may have been dropped since the flush was asked for.
+  // Everything may have been dropped since the flush was requested.
   if (unsentBytes() == 0) {
     clear();
     return Flush::kEmpty;
@@ -60,7 +60,7 @@ OutputQueue::Flush OutputQueue::flush(int fd, std::size_t& sentBytes, std::size_
   const ssize_t count = send(fd, buffer_->bytes.data() + buffer_->sentBytes, unsentBytes(),
                              MSG_NOSIGNAL | MSG_DONTWAIT);
   if (count < 0) {
-    // After EINTR too, the loop tries again as soon as the socket has room.
+    // Also after EINTR: the loop tries again as soon as the socket has room.
     if (errno == EAGAIN || errno == EINTR || errno == ENOBUFS) return Flush::kBlocked;
     droppedFrames += clear();
     return Flush::kPeerGone;
@@ -92,7 +92,7 @@ void OutputQueue::noteSent(std::size_t count) {
   buffer.bytes.erase(0, cut);
   buffer.frameEnds.erase(buffer.frameEnds.begin(),
                          buffer.frameEnds.begin() + static_cast<std::ptrdiff_t>(buffer.sentFrames));
-  // The ends count from the start of the buffer, which has moved.
+  // The ends are offsets from the start of the buffer, which has moved.
   for (std::size_t& end : buffer.frameEnds) end -= cut;
   buffer.sentBytes = 0;
   buffer.sentFrames = 0;

@@ -28,9 +28,9 @@ class OutputBufferPool {
   std::vector<std::unique_ptr<OutputBuffer>> spare_;
 };
 
-// What one connection has to send. Frames are appended and leave in order. One write sends all that
-// are there, so the replies of a turn cost one system call. Writing never blocks. Belongs to one
-// thread. Owned by its stream.
+// What one connection has to send. Frames are appended and leave in order. One write sends all of
+// them: the replies of a turn cost one system call. Writing never blocks. Belongs to one thread.
+// Owned by its stream.
 class OutputQueue {
  public:
   enum class Flush : std::uint8_t { kEmpty, kBlocked, kPeerGone };

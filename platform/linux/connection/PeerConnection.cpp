@@ -30,18 +30,18 @@ std::string PeerConnection::description() const {
 }
 
 void PeerConnection::setReading(bool reading) {
-  // A client that is held back cannot finish its message, so this is not its fault.
+  // This is not the client's fault: while it is held back, it cannot finish its message.
   if (!reading) deadline_.stop();
   // The handshake continues while the delegate has not accepted the client yet.
   stream_.setReading(reading || handshake_ != nullptr);
 }
 
 void PeerConnection::onReadable() {
-  // Messages that were read and wait for the next turn must be delivered before more is read.
+  // Deliver the messages that wait for the next turn before reading more.
   if (handshake_ == nullptr && !wantsInput()) return;
   if (stream_.read() == SocketStream::Read::kEnded) {
-    // A client may send its last requests and close at once. They are delivered before the
-    // connection ends.
+    // A client may send its last requests and close at once. Deliver them before the connection
+    // ends.
     peerClosed_ = true;
     stream_.setReading(false);
   }
@@ -83,7 +83,7 @@ void PeerConnection::onDelivered(bool begun, bool progress) {
   }
   stream_.setReading(true);
   if (handshake_ != nullptr) return;
-  // Only a whole message restarts the time, so a client gains nothing by sending single bytes.
+  // Only a whole message restarts the time: a client gains nothing by sending single bytes.
   if (progress || !begun) deadline_.stop();
   if (begun) host().messages().start(deadline_);
 }

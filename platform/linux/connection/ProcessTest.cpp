@@ -79,7 +79,7 @@ TEST_F(ProcessTest, SocketOfAKilledServiceIsReplaced) {
   waitForSocket();
 }
 
-// The shell gives the descriptor to the process that it becomes.
+// The program that replaces the shell inherits the descriptor.
 std::vector<std::string> activated(const std::vector<std::string>& command) {
   std::vector<std::string> shell = {"sh", "-c", "LISTEN_PID=$$ LISTEN_FDS=1 exec \"$0\" \"$@\""};
   shell.insert(shell.end(), command.begin(), command.end());
@@ -89,7 +89,7 @@ std::vector<std::string> activated(const std::vector<std::string>& command) {
 TEST_F(ProcessTest, PassedSocketTakesThePlaceOfItsOwn) {
   auto bound = listenOn(socketPath());
   const BoundSocket& socket = *bound;
-  RawClient early(socketPath());  // connects before anybody serves
+  RawClient early(socketPath());  // connects before the service runs
   early.authenticate(early.callWithText("echo", "early"));
   const std::vector<std::string> other = {HALVOX_TEST_SERVER,
                                           (directory_.path() / "unused").string()};
@@ -101,7 +101,7 @@ TEST_F(ProcessTest, PassedSocketTakesThePlaceOfItsOwn) {
   EXPECT_FALSE(std::filesystem::exists(directory_.path() / "unused"));
   service.signal(SIGTERM);
   EXPECT_EQ(service.waitForExit(), EXIT_SUCCESS);
-  EXPECT_TRUE(std::filesystem::exists(socketPath()));  // it is not its own to remove
+  EXPECT_TRUE(std::filesystem::exists(socketPath()));  // the file is not the service's to remove
 }
 
 TEST_F(ProcessTest, PassedDescriptorThatDoesNotListenIsRefused) {
@@ -149,7 +149,7 @@ TEST_F(ProcessTest, ClientsWaitWithoutCostWhenDescriptorsRunOut) {
   EXPECT_EQ(isSpinning(), 0);
   EXPECT_TRUE(staysQuiet(isSpinning, std::chrono::milliseconds(500)));
 
-  // A client that has been served makes room for those that wait; none is turned away.
+  // When a client leaves, a waiting one takes its place. None is refused.
   for (const auto& client : clients) {
     if (client != clients.front()) {
       EXPECT_TRUE(client->receive().has_value());

@@ -61,7 +61,7 @@ std::ptrdiff_t openDescriptors() {
                        std::filesystem::directory_iterator());
 }
 
-// Sends the bytes with a descriptor beside them.
+// Sends the bytes together with a descriptor.
 void sendWithDescriptor(int socket, std::string bytes, int descriptor) {
   iovec part{.iov_base = bytes.data(), .iov_len = bytes.size()};
   std::array<char, CMSG_SPACE(sizeof(int))> control{};
@@ -210,7 +210,7 @@ TEST(RefusalsTest, BrokenBodyClosesTheConnection) {
   ServiceUnderTest service;
   RawClient client(service.socketPath());
   std::string call = client.callWithText("echo", "\x31\x32\x33");
-  call[call.size() - 2] = '\xFF';  // no UTF-8
+  call[call.size() - 2] = '\xFF';  // not UTF-8
 
   client.authenticate(call);
 

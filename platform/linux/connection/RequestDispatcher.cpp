@@ -39,7 +39,7 @@ std::size_t weightOf(const InterfaceMethod& method) {
 ReplyCallback makeReply(const ClientConnection& client, const dbus::MessageHeader& header,
                         const InterfaceMethod& method) {
   if ((header.flags & dbus::kNoReplyExpected) != 0) {
-    // The object always calls its reply, also where D-Bus forbids to send one.
+    // The object always calls its reply, even if D-Bus forbids sending one.
     return [](const std::optional<Error>&, const Value&) {};
   }
   return [ticket = std::make_shared<ReplyTicket>(client.link(), header.serial, method.out)](
@@ -56,7 +56,7 @@ struct RequestDispatcher::Request {
   std::size_t frameBytes;
 
   [[nodiscard]] const dbus::MessageHeader& header() const { return frame.header; }
-  // True when the request is for the object that the client's connection exports.
+  // Returns true if the request is for the object that the client's connection exports.
   [[nodiscard]] bool isForExportedObject() const {
     const NSXPCInterface* exported = client.exportedInterface();
     return exported != nullptr && client.exportedObject() != nullptr &&
@@ -72,8 +72,8 @@ RequestDispatcher::RequestDispatcher(const ConnectionOptions& options,
 void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& frame,
                                  std::size_t frameBytes) {
   const dbus::MessageHeader& header = frame.header;
-  // The service asks clients nothing, so returns and errors answer nothing. D-Bus lets us ignore
-  // them.
+  // The service sends no calls to clients: returns and errors from them answer nothing. D-Bus
+  // allows ignoring them.
   if (header.type != dbus::MessageType::kMethodCall) {
     statistics_.messagesIgnored.add();
     return;
@@ -96,11 +96,11 @@ void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& fr
 }
 
 void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& method) {
-  // Rights and limits before the body: a refused request costs no decoding.
+  // Check rights and limits before the body: a refused request then needs no decoding.
   if (method.access == MethodAccess::kOwner && isForbidden(request, method)) return;
   if (method.effect != MethodEffect::kHoldsNoMore && isOverLimits(request, method)) return;
   if (!decode(request, method.in)) return;
-  // The only limit that needs the arguments.
+  // This is the only limit that depends on the arguments.
   if (namesTooManyReporters(request, method)) {
     arguments_.clear();
     return;
@@ -131,9 +131,9 @@ bool RequestDispatcher::isForbidden(const Request& request, const InterfaceMetho
   return true;
 }
 
-// Both bounds can be passed a little. Bytes are charged when a request is delivered, so one request
-// may add to less than the bound. Sessions count when they have been made, so requests that are
-// open can make some more.
+// Both bounds can be exceeded a little. A client below its bound may still send one request, whose
+// bytes are charged only at its delivery. Sessions count only once they have been made, and
+// requests that are still open can make a few more.
 bool RequestDispatcher::isOverLimits(const Request& request, const InterfaceMethod& method) {
   const ResourceUse use = request.client.exportedObject()->resourceUse();
   const std::uint64_t maxBytes = options_.clientHistoryMegabytes * kMiB;
@@ -186,11 +186,11 @@ void RequestDispatcher::answerStandard(const Request& request, const StandardMet
   }
 }
 
-// False when the request was refused or the client disconnected.
+// Returns false if the request was refused or the client has disconnected.
 bool RequestDispatcher::decode(const Request& request, std::string_view signature) {
   const dbus::MessageHeader& header = request.header();
-  // The socket is read without ancillary data, so the kernel has closed the descriptors.
-  // Without them the message is not what its sender meant.
+  // The socket is read without ancillary data, and the kernel has therefore closed the descriptors.
+  // Without them the message does not mean what its sender intended.
   if (header.unixFds != 0) {
     request.client.refuse(header, Refusal::kUnsupportedValue, error_names::kInvalidArgs,
                           quoted(header.member) + ": the message has " +

@@ -37,7 +37,8 @@ std::optional<sockaddr_un> addressOf(const std::filesystem::path& path) {
   return address;
 }
 
-// Removes a socket file that no process serves. An error when anything else is at the path.
+// Removes a socket file on which no process listens. Returns an error if anything else is at the
+// path.
 Result<void, Kind> clearTheWay(const std::filesystem::path& path, const sockaddr_un& address) {
   struct stat status {};
   if (lstat(path.c_str(), &status) != 0) return {};  // bind() reports other problems
@@ -49,7 +50,7 @@ Result<void, Kind> clearTheWay(const std::filesystem::path& path, const sockaddr
   if (!probe) return failure(Kind::kSystem, path, errnoText(errno));
   const int result =
       connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
-  // EAGAIN: the backlog is full, so somebody listens.
+  // EAGAIN: the backlog is full, which means that a process listens.
   if (result == 0 || errno == EAGAIN || errno == EINPROGRESS) {
     return failure(Kind::kAlreadyServed, path,
                    "another process answers on it; stop it or set listener.socket");
@@ -58,7 +59,7 @@ Result<void, Kind> clearTheWay(const std::filesystem::path& path, const sockaddr
     return failure(Kind::kSystem, path,
                    "cannot find out whether another process serves it: " + errnoText(errno));
   }
-  // Nobody listens: the service that made it was killed before it could remove it.
+  // No process listens: the service that made the file was killed before it could remove it.
   static_cast<void>(unlink(path.c_str()));
   return {};
 }
@@ -82,9 +83,10 @@ Failure<Kind> bindFailure(const std::filesystem::path& path, int error) {
   }
 }
 
-// The ID of the group; none if there is no group of that name.
+// Returns the ID of the group; std::nullopt if there is no group of that name.
 Result<std::optional<gid_t>> findGroup(const std::string& name) {
-  // A group with many members needs a large buffer. 16 MiB end a look-up that always wants more.
+  // A group with many members needs a large buffer. Give up at 16 MiB: a broken look-up could ask
+  // for more each time.
   constexpr std::size_t kLargestEntry = std::size_t{1} << 24U;
   group entry{};
   group* found = nullptr;
@@ -113,7 +115,7 @@ Result<void, Kind> giveToGroup(const std::filesystem::path& path, const std::str
         .message = "listener.group: expected a group of this system, found " + quoted};
   }
   constexpr uid_t kSameUser = static_cast<uid_t>(-1);
-  // The path and not the descriptor: fchown() of a socket does not change its file.
+  // Use the path and not the descriptor: fchown() of a socket does not change its file.
   if (fchownat(AT_FDCWD, path.c_str(), kSameUser, **id, AT_SYMLINK_NOFOLLOW) == 0) {
     return {};
   }
@@ -122,15 +124,15 @@ Result<void, Kind> giveToGroup(const std::filesystem::path& path, const std::str
                      errnoText(errno) + "; only root and members of the group may do that");
 }
 
-// bind() gives the file the permissions of the descriptor, minus the umask. They start with at most
-// the owner's, because a connect() that was admitted while the file was open to others succeeds
-// when the socket listens a moment later.
+// bind() gives the file the permissions of the descriptor, minus the umask. At first, only the
+// owner may have any: if the file were open to others now, a connect() of theirs could succeed as
+// soon as the socket listens.
 bool closeToOthers(int fd, const SocketAccess& access) {
   constexpr std::uint32_t kOwner = 0700;
   return fchmod(fd, access.mode & kOwner) == 0;
 }
 
-// Sets the group before the mode: the members of the old group must never get access.
+// Set the group before the mode: the members of the old group must never get access.
 Result<void, Kind> letIn(const std::filesystem::path& path, const SocketAccess& access) {
   if (!access.group.empty()) {
     if (auto given = giveToGroup(path, access.group); !given) return given;
@@ -166,7 +168,7 @@ SocketFile& SocketFile::operator=(SocketFile&& other) noexcept {
 
 void SocketFile::remove() noexcept {
   struct stat status {};
-  // Another service may have put its own socket in this place since.
+  // Another service may have replaced the file with its own socket.
   if (!path_.empty() && lstat(path_.c_str(), &status) == 0 && status.st_dev == device_ &&
       status.st_ino == inode_) {
     static_cast<void>(unlink(path_.c_str()));
@@ -191,7 +193,7 @@ Result<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& p
     return failure(Kind::kSystem, path, "cannot set its permissions: " + errnoText(errno));
   }
   if (bind(bound.fd.get(), generic, sizeof *address) != 0) return bindFailure(path, errno);
-  // From here on, each failure removes the file again.
+  // From here on, any failure removes the file again.
   bound.file = SocketFile(path);
   if (auto opened = letIn(path, access); !opened) return std::move(opened).error();
   if (listen(bound.fd.get(), SOMAXCONN) != 0) {
@@ -203,7 +205,8 @@ Result<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& p
 void makeDirectoryOf(const std::filesystem::path& path, const SocketAccess& access) {
   constexpr std::uint32_t kOthers = 0077;
   const std::string directory = path.parent_path().native();
-  // One that exists keeps its permissions: its owner chose them. Other failures show in bind().
+  // A directory that exists keeps its permissions, which its owner has chosen. If the directory
+  // cannot be made, bind() reports it.
   if (mkdir(directory.c_str(), 0700) != 0) return;
   if ((access.mode & kOthers) != 0) static_cast<void>(chmod(directory.c_str(), 0755));
 }

@@ -36,9 +36,9 @@ struct BoundSocket {
   SocketFile file;
 };
 
-// Makes the socket at `path`. Users that `access` excludes cannot connect at any time, not even
-// while it is made. Replaces a socket file that no process serves any more, and never any other
-// file. Blocks as long as a connect and a look-up of the group take.
+// Makes the socket at `path`. Users that `access` excludes can never connect, not even while the
+// socket is being made. Replaces a socket file that no process serves any more, and never any other
+// file. Blocks for one connect() and one look-up of the group.
 Result<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
                                                   const SocketAccess& access = {});
 

@@ -60,8 +60,8 @@ TEST_F(SocketFileTest, UnknownGroupIsAnErrorAndNoFileIsLeft) {
   EXPECT_FALSE(std::filesystem::exists(socketPath()));
 }
 
-// In the background: connects until it got in, which ends the process with status 1, or until it is
-// killed. Needs the rights of root, which it gives up.
+// Starts a process that tries to connect until it succeeds, and then exits with status 1, or until
+// it is killed. The process needs the rights of root, which it gives up.
 pid_t startIntruder(const path& socket) {
   const pid_t child = fork();
   if (child != 0) return child;
@@ -142,7 +142,7 @@ TEST_F(SocketFileTest, MissingDirectoryIsAnError) {
 TEST_F(SocketFileTest, DirectoryThatCannotBeWrittenIsAnError) {
   std::filesystem::permissions(directory_.path(), std::filesystem::perms(0555));
 
-  // In a process of its own, which gives up the rights of the administrator first.
+  // Runs in a process of its own, which first gives up the rights of root.
   const pid_t child = fork();
   if (child == 0) {
     constexpr uid_t kNobody = 65534;

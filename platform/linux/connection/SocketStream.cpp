@@ -19,7 +19,7 @@ SocketStream::SocketStream(UniqueFd fd, ConnectionHost& host, StreamOwner& owner
       output_(host.outputBuffers()) {}
 
 std::uint32_t SocketStream::nextSerial() {
-  // D-Bus forbids the serial 0. The counter wraps after four thousand million frames.
+  // D-Bus forbids the serial 0. The counter wraps around after 2^32 frames.
   if (++lastSerial_ == 0) ++lastSerial_;
   return lastSerial_;
 }
@@ -27,9 +27,9 @@ std::uint32_t SocketStream::nextSerial() {
 SocketStream::Read SocketStream::read() {
   const std::span<std::byte> room = input_.readInto(host_.scratch());
   const ssize_t count = ::read(fd_.get(), room.data(), room.size());
-  // Kept before received(), which may allocate and change it.
+  // Store errno before received(), which may allocate and change it.
   const int error = errno;
-  // Also when nothing came: readInto() may have moved what was left over.
+  // Needed even if nothing arrived: readInto() may have moved what was left over.
   input_.received(count > 0 ? static_cast<std::size_t>(count) : 0);
   if (count > 0) {
     host_.statistics().bytesReceived.add(static_cast<std::uint64_t>(count));
@@ -63,7 +63,7 @@ void SocketStream::flush() {
   if (dropped > 0) host_.statistics().repliesDroppedGone.add(dropped);
   const bool wasBlocked = std::exchange(blocked_, result == OutputQueue::Flush::kBlocked);
   if (wasBlocked != blocked_) updateInterest();
-  // Also after a failure: output that was dropped makes room too.
+  // Called after a failure, too: output that was dropped makes room.
   owner_.onOutputProgress();
 }
 
@@ -74,7 +74,7 @@ bool SocketStream::close() {
   }
   reading_ = false;
   blocked_ = false;
-  // Before the descriptor is closed: its number can be that of another connection at once.
+  // Do this before closing the descriptor: another connection can get its number at once.
   updateInterest();
   fd_.reset();
   return true;

@@ -36,13 +36,13 @@ class SocketStream final : public EventSource {
   [[nodiscard]] FrameBuffer& input() { return input_; }
   [[nodiscard]] OutputQueue& output() { return output_; }
   [[nodiscard]] std::uint32_t nextSerial();
-  // Continues after the serials that were used on the socket before.
+  // Continues with the serial after the last one that was used on the socket.
   void skipSerials(std::uint32_t last) { lastSerial_ = last; }
 
   // One read into input(). The caller must settle the input before another stream reads: all share
   // one scratch.
   Read read();
-  // Whether onReadable() is wanted.
+  // Says whether the owner wants calls of onReadable().
   void setReading(bool reading);
   // Call it after adding to output().
   void outputAdded();
@@ -64,7 +64,7 @@ class SocketStream final : public EventSource {
   std::uint32_t lastSerial_ = 0;
   std::uint32_t watched_ = 0;  // the events that the loop watches for; 0: not watched
   bool reading_ = false;
-  bool blocked_ = false;  // the socket took less than was there
+  bool blocked_ = false;  // the socket did not take everything
   bool flushing_ = false;
 };
 

@@ -38,7 +38,7 @@ StandardAnswer noProperties(const StandardRequest& /*request*/) {
   return {.value = Value(Dictionary{})};
 }
 
-// Methods of one interface stand together: the introspection opens each interface once.
+// Keep the methods of one interface together: the introspection opens each interface once.
 //
 // Peer is everywhere, because D-Bus defines it for every path, whether or not an object is there.
 constexpr std::array kObjectMethods = {
@@ -108,14 +108,15 @@ bool isParentPath(std::string_view path, std::string_view objectPath) {
 const StandardMethod* StandardInterfaces::find(const ClientConnection& client,
                                                const dbus::MessageHeader& request) const {
   const StandardMethod* method = findIn(kObjectMethods, client, request);
-  // Last: on a real bus these methods belong to the bus, and none of them is in scope.
+  // Look in these last. On a real bus, these methods belong to the bus, and none of them is found
+  // here.
   return method != nullptr ? method : findIn(busMethods(), client, request);
 }
 
 UnknownPart StandardInterfaces::unknownPartOf(const ClientConnection& client,
                                               const dbus::MessageHeader& request) const {
-  // In this order, from the method to the object: a client that has the interface right should
-  // learn that only the method is wrong.
+  // Checks in this order, from the method to the object: a client that names the right interface
+  // should learn that only the method is wrong.
   const bool isOwnInterface = isExportedObject(client, request.path) &&
                               request.interface == client.exportedInterface()->name;
   if (isOwnInterface || isInterfaceOf(kObjectMethods, client, request) ||

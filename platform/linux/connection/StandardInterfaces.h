@@ -59,9 +59,9 @@ std::span<const StandardMethod> busMethods();     // what a client asks its bus 
 enum class UnknownPart : std::uint8_t { kObject, kInterface, kMethod };
 
 // The interfaces of D-Bus itself, which the adapter answers on behalf of the exported object. For
-// clients on our own socket it also answers the few calls to the bus that client libraries make, so
-// that these work unchanged.
-// Belongs to the I/O thread. Owned by the dispatcher. Does not own the identity.
+// clients on our own socket it also answers the few calls to the bus that client libraries make:
+// these libraries then work unchanged. Belongs to the I/O thread. Owned by the dispatcher. Does not
+// own the identity.
 class StandardInterfaces {
  public:
   explicit StandardInterfaces(const ServiceIdentity& identity) : identity_(identity) {}

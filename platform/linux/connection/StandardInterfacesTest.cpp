@@ -24,7 +24,7 @@ constexpr const char* kBusPath = "/org/freedesktop/DBus";
 constexpr const char* kProperties = "org.freedesktop.DBus.Properties";
 constexpr const char* kServiceName = "com.tarno.halvox.reporting";
 
-// What a command prints, both ways out; the test's own tools only.
+// Returns what a command prints on both outputs. Only for the test's own commands.
 std::string outputOf(const std::string& command) {
   const UniqueHandle<std::FILE*, pclose> pipe(popen((command + " 2>&1").c_str(), "r"));
   std::string output;
@@ -141,7 +141,7 @@ TEST(StandardInterfacesTest, BusctlIntrospectsAndCalls) {
             "s \"hello\"\n");
 }
 
-// A proxy as desktop programs make it: Hello, matches, name owner, properties, introspection.
+// Makes a proxy as desktop programs do: Hello, matches, name owner, properties, introspection.
 constexpr const char* kGlibProgram = R"py(
 import sys
 import gi

@@ -41,15 +41,15 @@ bool TurnSchedule::hasWork() const {
 }
 
 void TurnSchedule::begin() {
-  // Swapped, so that a client which becomes due in this turn waits for the next one. Both lists
+  // Swap the lists: a client that becomes due in this turn must wait for the next one. Both lists
   // keep their capacity.
   std::swap(due_, next_);
   std::swap(ended_, ending_);
 }
 
 void TurnSchedule::deliver(std::size_t readyCount) {
-  // The clients of this turn's events have delivered already, with the share of the turn before:
-  // their number was not known until now.
+  // The clients with events in this turn have already delivered, with the share of the previous
+  // turn: their number was not known until now.
   requestsPerClient_ = readyCount + due_.size() <= kFewClients ? kTurnRequests : kShortTurnRequests;
   for (const std::shared_ptr<ClientConnection>& client : due_) client->deliver();
   due_.clear();
@@ -57,7 +57,7 @@ void TurnSchedule::deliver(std::size_t readyCount) {
 
 void TurnSchedule::finishEnded() {
   for (std::shared_ptr<ClientConnection>& client : ended_) {
-    // Handlers queue clean-up jobs, which belong to the batch of this turn.
+    // The handlers queue clean-up jobs, which must be part of this turn's batch.
     beforeDelivery();
     client->finish();
     finished_.push_back(std::move(client));
@@ -72,18 +72,17 @@ void TurnSchedule::endDeliveries() {
 }
 
 void TurnSchedule::relieve() {
-  // A client can have to wait again at once, and is then added to the list that is being gone
-  // through.
+  // Empty the list first: a client may have to wait again at once, and is then added to it.
   Clients relieved;
   std::swap(relieved, waitingForRelief_);
   for (const std::shared_ptr<ClientConnection>& client : relieved) client->onRelief();
 }
 
 void TurnSchedule::flush() {
-  // A flush can make its owner deliver or end in the next turn. It cannot add another flush.
+  // A flush can make its owner deliver or end in the next turn, but cannot add another flush.
   for (SocketStream* stream : flushing_) stream->flush();
   flushing_.clear();
-  // Only now: a thread of the pool that is woken earlier competes with the replies for a core.
+  // Wake the pool last: a pool thread that is woken earlier competes with the replies for a core.
   if (std::exchange(hasReplies_, false) && afterReplies_) afterReplies_();
 }
 

@@ -13,8 +13,9 @@ class SocketStream;
 
 // The lists of clients and streams that a turn of the loop works through after it has taken events.
 // Every client gets its share of deliveries, then all outputs are written. A client with more than
-// its share continues in the next turn, after those that have just become readable, so a flood of
-// one client delays the others by at most a share. Belongs to the I/O thread. Owned by the host.
+// its share continues in the next turn, after those that have just become readable, which means
+// that a flood of one client delays the others by at most one share. Belongs to the I/O thread.
+// Owned by the host.
 class TurnSchedule {
  public:
   // The functions of the same names in ConnectionOptions.
@@ -44,9 +45,10 @@ class TurnSchedule {
   void endDeliveries();
   void relieve();
   void flush();
-  // Releases the clients that have finished. Until now events of this turn could refer to them.
+  // Releases the clients that have finished. Not earlier: events of this turn may still refer to
+  // them.
   void reap() { finished_.clear(); }
-  // Forgets all clients: the loop has ended.
+  // Forgets all clients, because the loop has ended.
   void clear();
 
  private:
@@ -56,7 +58,7 @@ class TurnSchedule {
   std::function<void()> endBatch_;
   std::function<void()> afterReplies_;
   bool inBatch_ = false;
-  bool hasReplies_ = false;  // of a batch, not written yet
+  bool hasReplies_ = false;  // of a batch that were not written yet
   std::size_t requestsPerClient_;
   Clients due_;   // deliver in this turn
   Clients next_;  // deliver in the next turn

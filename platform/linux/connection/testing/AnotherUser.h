@@ -7,8 +7,9 @@
 
 namespace halvox::platform::linux_ {
 
-// While it lives, this thread alone acts as a user who is neither root nor the one of the test, and
-// connections that it makes are that user's for good. Needs the rights of root.
+// While this object exists, its thread, and no other, acts as a user who is neither root nor the
+// user of the test. Connections that it makes keep belonging to that user. Needs the rights of
+// root.
 class AnotherUser {
  public:
   static constexpr uid_t kUid = 65534;
@@ -21,7 +22,7 @@ class AnotherUser {
   ~AnotherUser() { become(0); }
 
  private:
-  // The library's own call changes all threads.
+  // Use the system call: the function of the C library would change all threads.
   static void become(uid_t user) {
     constexpr uid_t kSame = static_cast<uid_t>(-1);
     if (syscall(SYS_setresuid, kSame, user, kSame) != 0) std::abort();

@@ -11,23 +11,23 @@
 
 namespace halvox::platform::linux_ {
 
-// What a method answered: its texts and numbers as text, or the name and text of an error.
+// The answer of a method: its texts and numbers as text, or the name and text of an error.
 struct BusAnswer {
   std::string text;
   std::string errorName;
   std::string errorText;
 };
 
-// A client of the usual make, on the systemd library.
+// An ordinary client, which uses the systemd library.
 class BusClient {
  public:
   enum class Kind : bool { kPeer, kBusClient };
 
-  // A bus client introduces itself with Hello, a peer does not. Throws when it cannot connect.
+  // A bus client sends Hello first, a peer does not. Throws if it cannot connect.
   explicit BusClient(const std::string& address, Kind kind = Kind::kBusClient);
 
-  // Calls a method of the test's object. `types` and `arguments` as sd_bus_message_append takes
-  // them, texts only.
+  // Calls a method of the test's object. `types` and `arguments` are those of
+  // sd_bus_message_append(), for texts only.
   BusAnswer call(const std::string& member, const std::string& text);
   BusAnswer call(const std::string& member);
   // Calls any method without arguments or with text arguments.

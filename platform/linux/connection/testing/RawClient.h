@@ -23,32 +23,33 @@ struct RawAnswer {
   std::vector<Value> values;  // of the signature that the message has
 };
 
-// A client made of bytes, for what proper clients never do. Reads wait for kTestDeadline at most.
+// A client that sends any bytes, to test what proper clients never do. Reads wait for kTestDeadline
+// at most.
 class RawClient {
  public:
   explicit RawClient(const std::filesystem::path& socket);
 
-  // The handshake, in one go with what follows it.
+  // Sends the handshake in one write with what follows it.
   void authenticate(std::string_view withMore = {});
-  // Sends all, waiting for room.
+  // Sends everything, and waits for room.
   void send(std::string_view bytes);
-  // Sends what the socket takes without waiting; returns how much that was.
+  // Sends what the socket takes without waiting. Returns the number of bytes.
   std::size_t trySend(std::string_view bytes);
-  // The next message; none when the connection is closed or nothing comes.
+  // Returns the next message; std::nullopt if the connection is closed or nothing arrives in time.
   std::optional<RawAnswer> receive();
-  // True when the service closes the connection.
+  // Returns true if the service closes the connection.
   bool isClosedByService();
   void close() { fd_.reset(); }
   [[nodiscard]] int fd() const { return fd_.get(); }
 
-  // A call of the test's object. Serials count 1, 2, ...
+  // Returns a call of the test's object. The serials are 1, 2, ...
   std::string call(std::string_view member, std::string_view signature = "",
                    std::span<const Value> arguments = {});
   std::string callWithText(std::string_view member, std::string_view text);
   [[nodiscard]] std::uint32_t lastSerial() const { return serial_; }
 
  private:
-  // False when nothing more comes.
+  // Returns false if nothing more arrives.
   bool receiveMore();
 
   UniqueFd fd_;
@@ -58,7 +59,7 @@ class RawClient {
   bool awaitsHandshake_ = false;
 };
 
-// The same call without the wish for an answer.
+// The same call, with the flag that no reply is expected.
 std::string withoutReply(std::string call);
 
 }  // namespace halvox::platform::linux_

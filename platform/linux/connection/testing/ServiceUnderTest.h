@@ -30,7 +30,7 @@ class ServiceUnderTest {
   [[nodiscard]] std::uint64_t count(std::string_view name) const {
     return platform.statistics.value("connection", name);
   }
-  // How many lines of the log of that level have that in them.
+  // Returns how many log lines of that level contain the text.
   [[nodiscard]] std::size_t countLines(LogLevel level, std::string_view part) const;
   // Ends the service's resume().
   void stop();

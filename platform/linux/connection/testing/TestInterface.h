@@ -11,14 +11,14 @@
 
 namespace halvox::platform::linux_ {
 
-// What the tests export: an object whose methods show each way in which a request can be treated.
+// The object that the tests export. Its methods show each way in which a request can be treated.
 class TestObject final : public ExportedObject {
  public:
   [[nodiscard]] ResourceUse resourceUse() const override {
     return {.bytes = heldBytes.load(), .sessions = sessions.load()};
   }
 
-  // Requests to "busy" wait with their tokens, those to "hold" without.
+  // Open requests to "busy" keep their tokens, those to "hold" do not.
   void keepBusy(RequestToken token, ReplyCallback reply);
   void holdReply(ReplyCallback reply);
   void answerBusy();
@@ -62,7 +62,7 @@ class TestDelegate final : public NSXPCListenerDelegate {
   bool listenerShouldAcceptNewConnection(
       const std::shared_ptr<NSXPCConnection>& connection) override;
 
-  // What happened to connections, such as "accepted 1234", "interrupted 1234", "invalidated 1234".
+  // Events of connections, such as "accepted 1234", "interrupted 1234", "invalidated 1234".
   [[nodiscard]] std::vector<std::string> events() const;
   [[nodiscard]] bool hasSeen(const std::string& event) const;
 

@@ -15,7 +15,7 @@ namespace halvox::platform::linux_ {
 class TestProcess {
  public:
   struct Options {
-    std::vector<std::string> environment{};  // beside the test's own, NAME=value
+    std::vector<std::string> environment{};  // added to the test's own, NAME=value
     int passedFd = -1;                       // what the child gets as descriptor 3
   };
 
@@ -28,9 +28,10 @@ class TestProcess {
 
   [[nodiscard]] pid_t pid() const { return child_->pid(); }
   void signal(int number) const { child_->signal(number); }
-  // What the child prints first, up to the end of the line.
+  // Returns the first line that the child prints.
   std::string firstLine();
-  // Its exit status, once it has ended; none when a signal ended it or it does not end in time.
+  // Waits for its end and returns its exit status; std::nullopt if a signal ended it or it does not
+  // end in time.
   std::optional<int> waitForExit();
   // A number from a line of /proc/<pid>/status.
   [[nodiscard]] long statusNumber(const std::string& name) const;
@@ -39,7 +40,7 @@ class TestProcess {
 
  private:
   UniqueFd output_;
-  std::optional<ChildProcess> child_;  // always there
+  std::optional<ChildProcess> child_;  // never empty
 };
 
 }  // namespace halvox::platform::linux_

@@ -1,5 +1,5 @@
-// The service with the test's object as a process of its own, for what only a process can show.
-// Usage: TestServer <socket> [limit of descriptors]
+// Runs the service with the test's object in a process of its own, for tests that need one. Usage:
+// TestServer <socket> [limit of descriptors]
 
 #include <cstdio>
 #include <cstdlib>

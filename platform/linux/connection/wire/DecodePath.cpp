@@ -21,14 +21,13 @@ void appendEscaped(std::string& out, char byte) {
 }  // namespace
 
 std::string quotable(std::string_view text) {
-  // Cut first. The check for UTF-8 then reads 64 bytes, however long the text is.
+  // Cut the text first. The check for UTF-8 then reads at most 64 bytes.
   const std::string_view start = utf8Prefix(text, kMaxQuotedBytes);
   const bool isText = isUtf8WithoutNul(start);
   std::string out;
   for (const char byte : start) {
     const auto code = static_cast<unsigned char>(byte);
-    // Control characters could begin a line of their own in the log, or command a terminal that
-    // shows it.
+    // Control characters could start a new line in the log, or control the terminal that shows it.
     if (code < 0x20 || code == 0x7f || (code >= 0x80 && !isText)) {
       appendEscaped(out, byte);
     } else {

@@ -6,7 +6,7 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// Outside bytes as text for a log line. Printable ASCII and valid UTF-8 stay as they are,
+// Makes text for a log line from untrusted bytes. Printable ASCII and valid UTF-8 stay as they are,
 // everything else is escaped, and long texts are cut. The result is always valid UTF-8.
 [[nodiscard]] std::string quotable(std::string_view text);
 
@@ -20,7 +20,7 @@ class DecodePath {
   // The number of the argument, counted from 1.
   void setArgument(std::size_t number) { argument_ = number; }
 
-  // Empty when not even the argument is known.
+  // Empty if not even the argument is known.
   [[nodiscard]] std::string text() const;
 
  private:

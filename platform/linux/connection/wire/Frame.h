@@ -60,7 +60,7 @@ struct Frame {
   std::span<const std::byte> body;
 };
 
-// Why bytes are not a valid message: one line, and the offset in the frame where it shows.
+// Why bytes are not a valid message: one line, and the offset of the error in the frame.
 struct WireError {
   std::string message;
   std::size_t offset = 0;
@@ -86,7 +86,7 @@ struct FrameMeasure {
 // Reads and checks the header of one whole frame, of the size that measureFrame() returned: the
 // types of fields, the fields required for the type of message, names, paths, signatures, numbers
 // and padding. Checks and skips fields with unknown numbers. Accepts messages of unknown types.
-// After an error the rest of the stream cannot be understood. Allocates memory for errors only.
+// After an error, the rest of the stream cannot be read. Allocates memory only for errors.
 [[nodiscard]] std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame);
 
 }  // namespace halvox::platform::linux_::dbus

@@ -44,7 +44,7 @@ std::uint32_t numberAt(std::span<const std::byte> bytes, std::size_t offset, boo
   return number;
 }
 
-// What is wrong with the bytes that every frame starts with, and where; empty if nothing is.
+// Describes what is wrong with the first bytes of a frame, and where; empty if they are valid.
 std::string_view problemOfStart(std::span<const std::byte> bytes, std::size_t& offset) {
   offset = 0;
   if (!bytes.empty() && byteAt(bytes, 0) != 'l' && byteAt(bytes, 0) != 'B') {
@@ -104,15 +104,16 @@ class FieldReader {
       return reader_.fail("its type is not the one that D-Bus defines");
     }
     const unsigned bit = 1U << code_;
-    // Of two paths, a bus could check its policy by the first while this would act on the last.
+    // If a field could occur twice, a bus could check its policy with the first path while the
+    // service acts on the second.
     if ((seen_ & bit) != 0) return reader_.fail("occurs twice");
     seen_ |= bit;
     return readKnown(static_cast<HeaderField>(code_));
   }
 
   bool skipUnknown(std::string_view type) {
-    // A field with an unsupported type is skipped like any other. One with an invalid type has no
-    // known length, so the next field could not be found.
+    // A field with an unsupported type is skipped like any other. A field with an invalid type has
+    // no known length: the next field could not be found.
     const SignatureShape shape = shapeOfType(type);
     if (shape == SignatureShape::kBroken || shape == SignatureShape::kTooDeep) {
       return reader_.fail("its signature is invalid");
@@ -144,14 +145,14 @@ class FieldReader {
       case HeaderField::kSignature:
         return reader_.readSignature(header_.signature);
       case HeaderField::kUnixFds:
-        // Only noted. The dispatcher refuses a request that has descriptors.
+        // Only store the number here: the dispatcher refuses requests that have descriptors.
         return reader_.read(header_.unixFds);
     }
     return false;
   }
 
   // The rules of names allow ASCII characters only, so the check for UTF-8 is not needed. It would
-  // go over every name twice, in every frame.
+  // read every name twice.
   bool readName(std::string_view& name, bool (*isValid)(std::string_view)) {
     return reader_.readUncheckedText(name) && (isValid(name) || reader_.fail("invalid name"));
   }
@@ -206,8 +207,8 @@ std::variant<Frame, WireError> finish(MessageHeader header, std::span<const std:
 FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrameBytes) {
   std::size_t offset = 0;
   const std::string_view problem = problemOfStart(bytes, offset);
-  // Looks at each of the first bytes as soon as it is there: a broken stream ends now and not after
-  // the time limit of a message.
+  // Checks each of the first bytes as soon as it has arrived: a broken stream then ends at once,
+  // not after the time limit of a message.
   if (!problem.empty()) return broken(std::string(problem), offset);
   if (bytes.size() < kFrameStartBytes) return {};
 
@@ -219,7 +220,8 @@ FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrame
     return broken("the header claims more than 64 MiB of fields", kFieldsLengthOffset);
   }
   const std::uint64_t total = roundedUp(kFrameStartBytes + fieldsBytes) + bodyBytes;
-  // Apart from the caller's limit below, so that the error names the limit that was exceeded.
+  // Checked separately from the caller's limit below: the error must name the limit that was
+  // exceeded.
   if (total > kMaxMessageBytes) {
     return broken("the header claims a message of " + std::to_string(total) +
                       " bytes, the limit of D-Bus is " + std::to_string(kMaxMessageBytes),

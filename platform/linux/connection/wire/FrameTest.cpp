@@ -15,7 +15,7 @@ std::string startOf(std::uint32_t bodyBytes, std::uint32_t fieldsBytes) {
   return WireBytes().raw("l").u8(1).u8(0).u8(1).u32(bodyBytes).u32(1).u32(fieldsBytes).bytes();
 }
 
-// Empty when the frame is taken.
+// Empty if the frame is accepted.
 std::string errorOf(const std::string& frame) {
   const auto result = readFrame(asBytes(frame));
   const auto* error = std::get_if<WireError>(&result);

@@ -51,13 +51,14 @@ class FrameBuilder {
       beginField(HeaderField::kSignature, "g");
       encoder_.appendSignature(signature);
     }
-    // Before the padding: it belongs to neither length.
+    // Compute this before the padding, which belongs to neither length.
     encoder_.replaceLength(start_ + kFieldsLengthOffset, out_.size() - start_ - kFrameStartBytes);
     encoder_.align(8);
     const std::size_t bodyStart = out_.size();
     if (!encoder_.appendAll(signature, values)) return false;
     encoder_.replaceLength(start_ + kBodyLengthOffset, out_.size() - bodyStart);
-    // A length that did not fit into 32 bits has been cut just now. This removes that frame.
+    // If a length did not fit into 32 bits, it has just been truncated. The frame is then over the
+    // limit and is removed.
     finished_ = out_.size() - start_ <= kMaxMessageBytes;
     return finished_;
   }
@@ -87,8 +88,8 @@ bool isValid(const CallTarget& target, std::uint32_t serial) {
 }
 
 // Nearly all replies have no value or a boolean, and go to a client without a bus name. Their
-// frames differ in three numbers only, so they are copied from a constant instead of being built.
-// The zeros of the serials and of the value are filled in.
+// frames differ in only three numbers. They are therefore copied from a constant, in which the
+// zeros of the serials and of the value are then replaced.
 constexpr std::string_view kPlainReply(
     "l\2\1\1"    // kMethodReturn, kNoReplyExpected, kProtocolVersion
     "\0\0\0\0"   // no body
@@ -130,7 +131,7 @@ void appendBooleanReply(std::string& out, std::uint32_t replySerial, std::uint32
 
 bool appendMethodReturn(std::string& out, const ReplyTo& replyTo, std::uint32_t serial,
                         std::string_view signature, const Value& value) {
-  // Before anything is appended: on an error, `out` stays as it was.
+  // Check before anything is appended: on an error, `out` must stay unchanged.
   if (!isValid(replyTo, serial)) return false;
   if (replyTo.destination.empty() && signature.empty()) {
     appendPlainReply(out, replyTo.serial, serial);

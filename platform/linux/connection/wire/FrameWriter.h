@@ -11,9 +11,9 @@
 //
 // Each returns false and leaves `out` unchanged if the message cannot be encoded: a value does not
 // fit its signature, a text is not UTF-8 or contains a NUL, a name or path is invalid, a serial is
-// 0, containers nest more than kMaxNesting levels (dictionary entries count here, because some
-// readers count them), or an array or the message exceeds the limits of D-Bus. The only memory that
-// they allocate is that of `out`.
+// 0, containers are nested more than kMaxNesting levels deep (dictionary entries count here,
+// because some readers count them), or an array or the message exceeds the limits of D-Bus. The
+// only memory that they allocate is that of `out`.
 namespace halvox::platform::linux_::dbus {
 
 // The call that a reply answers. `destination` is the caller's bus name; empty without a bus.

@@ -18,7 +18,7 @@ const ReplyTo kPeer{7, {}};
 const CallTarget kTarget{"org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus",
                          "AddMatch"};
 
-// A frame that was written, read back. Keeps the bytes that it points into.
+// A written frame that was read back, with the bytes that it points into.
 struct Written {
   std::string bytes;
   Frame frame;
@@ -82,7 +82,8 @@ TEST(FrameWriterTest, ReplyOverABusNamesItsDestination) {
 }
 
 TEST(FrameWriterTest, ShortFormsOfFrequentRepliesAreTheGeneralOnes) {
-  // The general way of writing is taken for a bus; without the destination it must give the same.
+  // For a bus, the frame is written in the general way. Without the destination, it must be the
+  // same frame.
   const auto withoutDestination = [](std::string_view signature, const WireBytes& body) {
     WireBytes fields;
     fields.u8(5).signature("u").u32(7);
@@ -261,7 +262,7 @@ TEST(FrameWriterTest, NestingPastTheLimitHasNoForm) {
     return value;
   };
 
-  // Each array of mixed kinds is an array and a variant.
+  // Each array of mixed kinds counts as two levels: an array and a variant.
   EXPECT_TRUE(hasForm("v", nested(31)));
   EXPECT_FALSE(hasForm("v", nested(32)));
   EXPECT_FALSE(hasForm("v", nested(500)));

@@ -40,7 +40,7 @@ Array oneToFiveCounted() {
   return {Array{std::int64_t{1}}, Array{}, Array{std::int64_t{2}, std::int64_t{3}}};
 }
 
-// What the cases that start with a number, a text or an array decode to.
+// The expected values of the cases without containers.
 std::map<std::string_view, Values> expectedBasics() {
   const double infinity = std::numeric_limits<double>::infinity();
   return {
@@ -196,7 +196,7 @@ TEST(GoldenFramesTest, FrameCutAnywhereIsAnError) {
   for (const GoldenFrame& frame : kGoldenFrames) {
     const std::string bytes = fromHex(frame.hex);
     for (std::size_t length = 0; length < bytes.size(); ++length) {
-      // A copy of just these bytes lets AddressSanitizer see a read past them.
+      // Make a copy of exactly these bytes: AddressSanitizer then detects reads past their end.
       const std::vector<char> cut(bytes.begin(),
                                   bytes.begin() + static_cast<std::ptrdiff_t>(length));
       const auto result = readFrame(std::as_bytes(std::span(cut)));
@@ -223,8 +223,7 @@ TEST(GoldenFramesTest, BodyCutAnywhereIsMalformed) {
   }
 }
 
-// No expectation but that nothing reads or writes out of bounds, and that what is taken can be
-// looked at.
+// Expects only that nothing reads or writes out of bounds, and that accepted values can be read.
 TEST(GoldenFramesTest, FramesWithAnyBitFlippedAreReadOrRefused) {
   Values arguments;
   std::size_t taken = 0;

@@ -83,8 +83,8 @@ ServerHandshake::ServerHandshake(std::string guidHex, uid_t peerUid)
 HandshakeProgress ServerHandshake::feed(std::span<const std::byte> input, std::string& output) {
   std::span<const std::byte> rest = input;
   if (step_ == Step::kNul && !rest.empty()) {
-    // D-Bus demands it. On some systems this byte carried the credentials; here the kernel has
-    // them.
+    // D-Bus requires this byte. On some systems it carries the credentials; here the kernel
+    // provides them.
     if (rest.front() != std::byte{0}) fail("the first byte is not NUL");
     if (step_ == Step::kNul) step_ = Step::kAuth;
     rest = rest.subspan(1);
@@ -111,7 +111,8 @@ void ServerHandshake::onLine(std::string_view line, std::string& output) {
     if (step_ == Step::kBegin) {
       step_ = Step::kDone;
     } else {
-      // Not an ERROR: the client may already send messages, and D-Bus requires to disconnect it.
+      // Do not answer ERROR: the client may already be sending messages, and D-Bus requires a
+      // disconnect.
       fail("BEGIN before the authentication");
     }
   } else if (command == "AUTH" && step_ == Step::kAuth) {
@@ -121,7 +122,7 @@ void ServerHandshake::onLine(std::string_view line, std::string& output) {
   } else if (command == "CANCEL" || command == "ERROR") {
     onCancel(command, output);
   } else if (command == "NEGOTIATE_UNIX_FD" && step_ == Step::kBegin) {
-    // Clients continue without descriptors. The service takes none, so it cannot leak any.
+    // Clients continue without descriptors. The service accepts none and therefore cannot leak any.
     output += "ERROR file descriptors are not taken\r\n";
     countRefusal();
   } else {
@@ -133,16 +134,16 @@ void ServerHandshake::onAuth(std::string_view arguments, std::string& output) {
   const auto [mechanism, response] = split(arguments);
   if (mechanism == "ANONYMOUS") {
     if (isHex(response)) {
-      // The kernel has said who the client is. Nothing in the handshake can change that, so
-      // anonymous clients need not be refused.
-      accept(output);  // the trace that the client sends is not used
+      // The kernel provides the client's identity, which the handshake cannot change. Anonymous
+      // clients need not be refused.
+      accept(output);  // ignores the trace that the client sends
     } else {
       reject(output);
     }
   } else if (mechanism != "EXTERNAL") {
     reject(output);
   } else if (response.empty()) {
-    // The identity may follow in a line of its own; sd-bus sends it so.
+    // The identity may follow in a separate line, as sd-bus sends it.
     step_ = Step::kData;
     output += "DATA\r\n";
   } else {
@@ -151,7 +152,8 @@ void ServerHandshake::onAuth(std::string_view arguments, std::string& output) {
 }
 
 void ServerHandshake::onIdentity(std::string_view hex, std::string& output) {
-  // An empty identity means the one that the kernel has. Any other must be equal to that.
+  // An empty identity stands for the one that the kernel provides. Any other must be equal to that
+  // one.
   if (hex.empty() || (isHex(hex) && fromHex(hex) == peerUid_)) {
     accept(output);
   } else {
@@ -203,7 +205,7 @@ void ClientHandshake::start(std::string& output) const {
 HandshakeProgress ClientHandshake::feed(std::span<const std::byte> input, std::string& output) {
   std::span<const std::byte> rest = input;
   if (state_ == HandshakeState::kContinue) {
-    // One line: a server answers with no more, and what follows belongs to the messages.
+    // Take only one line: a server answers with one line, and what follows belongs to the messages.
     if (line_.take(rest)) {
       onLine(line_.text(), output);
     } else if (line_.isTooLong()) {

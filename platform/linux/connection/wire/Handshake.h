@@ -8,8 +8,8 @@
 
 #include <sys/types.h>
 
-// The authentication before the first message, for either side. It does no input or output: the
-// owner of the socket passes in what it has read, and sends what it gets.
+// The authentication before the first message, for either side. It does no input or output itself:
+// the owner of the socket passes in what it has read, and sends the output that it gets back.
 namespace halvox::platform::linux_::dbus {
 
 enum class HandshakeState : std::uint8_t {

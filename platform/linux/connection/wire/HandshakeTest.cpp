@@ -15,7 +15,7 @@ const std::string kNul(1, '\0');
 const std::string kOk = "OK " + std::string(kGuid) + "\r\n";
 const std::string kRejected = "REJECTED EXTERNAL ANONYMOUS\r\n";
 
-// What one conversation came to.
+// The result of one conversation.
 struct Outcome {
   State state = State::kContinue;
   std::string output;
@@ -37,7 +37,7 @@ Outcome converse(std::string_view input, std::size_t pieceSize = SIZE_MAX) {
   return outcome;
 }
 
-// What a client says in that many lines.
+// Returns what a client sends: a NUL, then each text as a line.
 std::string lines(std::initializer_list<std::string_view> texts) {
   std::string input = kNul;
   for (const std::string_view text : texts) input.append(text).append("\r\n");
