@@ -18,8 +18,8 @@ using AnalyticsPayloadBuilder = std::function<Dictionary()>;
 // There are two steps: a cheap question, then a builder that runs on another thread. Building and
 // encoding a payload is expensive, and not every event is collected.
 //
-// Any thread may call. The composition root owns the service. A failure of storage does not come
-// back to the caller: the service counts the events that it drops, and logs them.
+// Any thread may call. The composition root owns the service. A failure of storage is not reported
+// to the caller: the service counts the events that it drops, and logs them.
 class AnalyticsService {
  public:
   virtual ~AnalyticsService() = default;

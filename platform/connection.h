@@ -113,8 +113,8 @@ struct NSXPCInterface {
 //                     └--> interrupted --> open or invalidated
 //
 // Shared by the service that made it and by code that holds it for an answer. Handlers and requests
-// run on the connection's thread, one at a time. Whatever goes wrong on the wire ends in the
-// invalidation handler; no call here fails.
+// run on the connection's thread, one at a time. Every failure on the wire ends in the invalidation
+// handler; no call here fails.
 class NSXPCConnection {
  public:
   virtual ~NSXPCConnection() = default;
@@ -128,9 +128,9 @@ class NSXPCConnection {
   virtual void setExportedInterface(const NSXPCInterface& interface) = 0;
   // The connection holds the object until it is invalidated.
   virtual void setExportedObject(std::shared_ptr<ExportedObject> object) = 0;
-  // Called when the other end has disconnected but the connection might come back.
+  // Called when the other end has disconnected but the connection may be restored.
   virtual void setInterruptionHandler(std::function<void()> handler) = 0;
-  // Called once, after all other calls: the connection has ended and does not come back.
+  // Called once, after all other calls: the connection has ended and is not restored.
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
   // Starts delivery. Requests arrive in later turns of the thread's loop, never inside this call.
   virtual void resume() = 0;

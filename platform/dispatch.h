@@ -13,7 +13,7 @@ namespace halvox::platform {
 // continues.
 using Job = std::function<void()>;
 
-// How urgent the work of a queue is. Clients wait for user-interactive work; nobody waits for
+// How urgent the work of a queue is. Clients wait for user-interactive work. They do not wait for
 // utility and background work, which therefore runs at a lower scheduling priority.
 enum class QualityOfService : std::uint8_t { kUserInteractive, kUtility, kBackground };
 

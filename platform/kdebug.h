@@ -4,7 +4,7 @@
 
 namespace halvox::platform {
 
-// Trace points: marks in the system trace that cost next to nothing while nobody records them.
+// Trace points: marks in the system trace that cost almost nothing while no tracer records them.
 //
 // Any thread may call. A mark that no tracer records is lost silently. The composition root owns
 // the service.

@@ -29,7 +29,7 @@ class LogCategory {
   LogCategory(const LogCategory&) = delete;
   LogCategory& operator=(const LogCategory&) = delete;
 
-  // True if someone wants lines of that level.
+  // True if lines of that level are wanted.
   [[nodiscard]] bool isEnabled(LogLevel level) const {
     // Relaxed, because a change of the level may be seen a little later.
     return level >= threshold_.load(std::memory_order_relaxed);

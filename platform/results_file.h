@@ -31,8 +31,8 @@ class ResultsFileService {
                                std::uint32_t version, std::uint32_t flags) = 0;
   virtual void sswriter_new_value(Sswriter& writer, std::string_view name, ssunit unit,
                                   double value) = 0;
-  // Finishes the file, which then appears under its name and replaces an older one. Until then
-  // nobody sees it; a writer that is destroyed instead leaves nothing. Does nothing without a
+  // Finishes the file, which then appears under its name and replaces an older one. Until then it
+  // is not visible. A writer that is destroyed instead leaves no file. Does nothing without a
   // writer.
   virtual void sswriter_close(Writer writer) = 0;
 };

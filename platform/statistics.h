@@ -17,7 +17,7 @@ class Counter {
 };
 
 // The service's own bookkeeping: what was received, delivered, suppressed and dropped, by reason.
-// For each piece, received = delivered + suppressed + dropped. A loss that nobody counted shows as
+// For each piece, received = delivered + suppressed + dropped. A loss that was not counted shows as
 // a difference.
 //
 // Any thread may call. The composition root owns the service.

@@ -69,9 +69,9 @@ struct TLMReportingMessage {
 
 // The real-time reporting framework: forwards messages to the servers that collect them.
 //
-// Any thread may call; one session is used by one thread at a time. No call waits for a server:
-// whatever takes time ends in a callback, which must not block either. The composition root owns
-// the service. The spelling of the functions is part of the interface.
+// Any thread may call; one session is used by one thread at a time. No call waits for a server: a
+// call that takes time reports its end to a callback, which must not block either. The composition
+// root owns the service. The spelling of the functions is part of the interface.
 class TLMReportingService {
  public:
   // Called with the back-ends that were found, or with std::nullopt if none was.

@@ -145,7 +145,7 @@ class Data {
 };
 
 // The type that a number was made from. Comparison ignores it; encoders use it to write the number
-// as it came.
+// in its original form.
 enum class NumberKind : std::uint8_t {
   kBool,
   kUInt8,
@@ -180,7 +180,7 @@ enum class ValueKind : std::uint8_t { kNone, kNumber, kString, kDate, kData, kAr
 // Strings are UTF-8. Code that makes a value from outside bytes checks that first.
 class Value {
  public:
-  Value() noexcept = default;  // no value; equal only to another one of these
+  Value() noexcept = default;  // no value; equal only to another value without content
   template <ArithmeticNumber Number>
   Value(Number number) noexcept;
   Value(std::string_view text);

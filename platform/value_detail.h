@@ -86,7 +86,7 @@ struct DictionaryRep {
 };
 
 // A hash with a secret that each process chooses for itself. For tables whose keys come from
-// clients: without the secret nobody can choose keys that collide.
+// clients: without the secret, a client cannot choose keys that collide.
 std::uint32_t secretHash(std::string_view text);
 
 }  // namespace halvox::platform::detail

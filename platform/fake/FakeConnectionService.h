@@ -57,7 +57,7 @@ class FakeConnection final : public NSXPCConnection {
   // connection was not resumed or has ended, if it has no such method, or if the number of
   // arguments is not that of the method's signature.
   std::shared_ptr<FakeCall> call(std::string_view method, std::vector<Value> arguments = {});
-  // The other end has gone, but the connection might come back.
+  // The other end has disconnected, but the connection may be restored.
   void interrupt();
   // Ends the connection: calls the invalidation handler once, then releases the exported object.
   void invalidate();

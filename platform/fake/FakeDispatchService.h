@@ -91,7 +91,7 @@ class FakeDispatchService final : public DispatchService {
   // Runs the oldest job that may run. Returns false if there is none.
   bool runOne();
   // Lets time pass. Runs all waiting jobs; then each delayed job and the end of each wait at its
-  // time, with everything that follows from it. At equal times delayed jobs come first. The clock
+  // time, with everything that follows from it. At equal times, delayed jobs run first. The clock
   // shows the time of the job that runs.
   void advance(std::chrono::nanoseconds by);
   // Drops all jobs that have not run, and ends all waits without calling anything. If the

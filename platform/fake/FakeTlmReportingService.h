@@ -62,7 +62,7 @@ class FakeTlmReportingService final : public TLMReportingService {
   [[nodiscard]] std::vector<std::string> tokens() const;
   // The arguments of each session, in the order of creation.
   [[nodiscard]] std::vector<Info> sessions() const;
-  // The number of sessions that someone still holds.
+  // The number of sessions that still exist.
   [[nodiscard]] std::size_t liveSessions() const;
   [[nodiscard]] std::size_t waitingDiscoveries() const;
   [[nodiscard]] std::size_t waitingFlushes() const;

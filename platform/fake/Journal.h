@@ -11,14 +11,14 @@ namespace halvox::platform {
 // The kind of a journal entry; the comments say what its text is.
 enum class JournalKind : unsigned char {
   kLogLine,          // text: the line without its prefix
-  kTracePoint,       // text: the code as "0x21044828"
+  kTracePoint,       // text: the code, such as "0x21044828"
   kAnalyticsTest,    // text: the name that was tested
   kAnalyticsEvent,   // text: the name that was sent
   kMetric,           // text: the metric's identifier in decimal digits
   kPowerEvent,       // text: the event's name
   kSnapshotRequest,  // text: the signature's description
-  kLink,             // text: the call of the real-time framework, as "send session 1 4/1"
-  kFile,             // text: the call for a directory or file, as "file /a/b.json"
+  kLink,             // text: the call of the real-time framework, such as "send session 1 4/1"
+  kFile,             // text: the call for a directory or file, such as "file /a/b.json"
   kReply,            // text: the name of the method that was answered
   kTermination,      // text: the exit status
   kNote,             // text: whatever the test wrote

@@ -49,8 +49,8 @@ struct LinuxAdapters {
   // The adapter of the back-end that the configuration names.
   [[nodiscard]] TLMReportingService& realTimeLink();
 
-  // The connections come before everything that has threads, because they block the end signals in
-  // every thread that starts after them.
+  // The connections are made before everything that has threads, because they block the end signals
+  // in every thread that starts after them.
   const Configuration configuration;
   CounterStatisticsService statistics;
   Backpressure backpressure;
@@ -72,7 +72,8 @@ struct LinuxAdapters {
   InotifyNotifyService notify;
   SqlitePowerLogService powerLog{store, clock};
   TomlPreferenceService preferences;
-  // Uses the queues, which come later; close() ends it while they are still there.
+  // Uses the queues, which are members below and are destroyed first; close() ends it while they
+  // still exist.
   CallbackThread linkCallbacks{dispatch};
   LocalTlmReportingService localLink{store, clock, linkCallbacks};
   NoneTlmReportingService noLink{statistics, linkCallbacks};

@@ -105,12 +105,12 @@ bool LinuxPlatform::close() {
   adapters_->dispatch.finish(kQueuesFinishWithin);
   const bool ended = adapters_->dispatch.stop(kJobsEndWithin);
   ended ? adapters_->traces->close() : adapters_->traces->abandon();
-  // Stop the callbacks after the queues: no session can request a callback any more.
+  // Stop the callbacks after the queues: then no session can request a callback.
   adapters_->linkCallbacks.stop();
   const bool linkEnded = !adapters_->nats || adapters_->nats->close();
   // Close the store after the link: the local link writes to it until its last message.
   adapters_->store.close();
-  // Log the counters when nothing counts any more: their sums agree only then.
+  // Log the counters after everything that counts has ended: their sums agree only then.
   logStatistics(LogLevel::kInfo, Counters::kCounted);
   // Stop the log last, because everything above may log.
   adapters_->log->stop();

@@ -20,7 +20,7 @@ namespace halvox::platform::contract {
 //   bool letRunUntil(const std::function<bool()>& condition);  // false if it never becomes true
 //   static constexpr bool kFindsBackends;   // whether a discovery finds any
 //   static constexpr bool kTakesMessages;   // whether a message is taken
-//   std::vector<std::int64_t> arrived();    // the numbers of the servers' messages, in order
+//   std::vector<std::int64_t> arrived();    // the numbers of the messages that arrived, in order
 //   void breakSending();                    // makes the service refuse messages
 // and, if it needs a server, static bool isAvailable(); without the server the suite is skipped.
 template <typename Harness>

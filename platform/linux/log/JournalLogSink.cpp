@@ -79,7 +79,7 @@ bool isJournalStream(int descriptor) {
   const auto second = std::from_chars(first.ptr + 1, end, inode);
   if (second.ec != std::errc{} || second.ptr != end) return false;
   struct stat status {};
-  // The variable is inherited by programs whose standard error goes elsewhere, such as to a file.
+  // Programs also inherit the variable if their standard error is something else, such as a file.
   return ::fstat(descriptor, &status) == 0 && status.st_dev == device && status.st_ino == inode;
 }
 

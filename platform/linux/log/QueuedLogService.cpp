@@ -105,7 +105,7 @@ void QueuedLogService::run() {
   }
 }
 
-// The line is not counted as received: nobody logged it.
+// The line is not counted as received, because no caller logged it.
 void QueuedLogService::reportLosses() {
   const std::uint64_t lost = unreported_.exchange(0, std::memory_order_relaxed);
   if (lost == 0) return;

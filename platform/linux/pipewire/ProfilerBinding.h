@@ -13,8 +13,8 @@ namespace halvox::pipewire {
 // when it is not installed. Must be called before the context connects.
 [[nodiscard]] bool loadProfilerModule(pw_context* context);
 
-// Follows the profiler of the server and passes on each of its events. They come many times a
-// second while streams run, and wake this process: make one only while they are wanted.
+// Follows the profiler of the server and passes on each of its events. Events arrive many times a
+// second while streams run, and wake this process: make a binding only while events are wanted.
 class ProfilerBinding {
  public:
   using ProfileHandler = std::function<void(const spa_pod* profile)>;

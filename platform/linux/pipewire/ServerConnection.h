@@ -29,7 +29,7 @@ class ServerListener {
 
   // The server has answered for the first time on this connection.
   virtual void onServerReached(const pw_core_info& server) = 0;
-  // The server has ended the connection. Let a timer call disconnect().
+  // The server has ended the connection. Call disconnect() later, from a timer.
   virtual void onServerLost() = 0;
   virtual void onGlobal(const Global& global) = 0;
   virtual void onGlobalRemoved(GlobalID id) = 0;

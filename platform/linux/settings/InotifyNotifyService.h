@@ -28,9 +28,9 @@ inline constexpr NotifyStatus kNotifyFailed = 1'000'000;
 // after each other cause one post, so that one save posts once, however the editor saves. No change
 // is lost.
 //
-// A thread of its own waits for changes, from the first registration on, without a timer. The
+// From the first registration on, a thread of its own waits for changes, without a timer. The
 // directories may be missing, and may be deleted and created again. Symbolic links on the way to a
-// preference file or to the notify directory are followed: a change of the target, and of a link,
+// preference file or to the notify directory are followed: a change of the target or of a link
 // counts. When the files cannot be watched, for example because of the kernel's limits, the thread
 // logs an error once and tries again every five seconds.
 //

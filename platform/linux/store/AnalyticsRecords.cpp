@@ -127,7 +127,7 @@ SqliteCode AnalyticsRecords::insert(const Event& event, const Event* twin,
 }
 
 SqliteCode AnalyticsRecords::identify(EventName& name) {
-  // The usual case: the same names come again and again.
+  // The usual case: the same names are used again and again.
   if (name.generation == generation_) return SQLITE_OK;
   statements_.insertName.bind(1, name.text);
   // Insert first and look up afterwards: the name may be in the database from an earlier run.

@@ -16,7 +16,7 @@ enum class DropReason : std::uint8_t {
   kDamaged,      // the file turned out to be broken
   kInputOutput,  // any other failure of SQLite or of the system
   kTooLarge,     // the payload is longer than StoreSizes::payloadBytes
-  kClosed,       // the record came after SqliteStore::close()
+  kClosed,       // the record was added after SqliteStore::close()
 };
 constexpr std::size_t kDropReasons = 7;
 // The name under which the drops of that reason are counted, such as "dropped: disk full".

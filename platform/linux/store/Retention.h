@@ -12,8 +12,8 @@ namespace halvox::platform::linux_ {
 // Keeps the store within its limits of age and size: deletes the oldest records of all kinds, in
 // small transactions between those that store records.
 // Owned by the store and used by the writer's thread only. Has no timer, because an idle service
-// must cause no wake-ups: the writer calls it at the start and after commits. Records of a service
-// that receives nothing therefore outlive their age until the next record comes.
+// must cause no wake-ups: the writer calls it at the start and after commits. Expired records of a
+// service that receives nothing therefore stay until the next record is written.
 class Retention {
  public:
   struct Limits {

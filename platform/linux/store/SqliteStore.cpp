@@ -70,7 +70,7 @@ void SqliteStore::close() {
 
 void SqliteStore::run() {
   setUpThread("halvox-store");
-  // Records may have expired since the last run, and none may come for a long time.
+  // Records may have expired since the last run, and no new record may arrive for a long time.
   maintainWhileIdle();
   const auto takeAll = [this] {
     for (RecordKind* const kind : kinds_) kind->takeQueued();

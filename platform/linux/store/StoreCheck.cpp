@@ -23,7 +23,7 @@ constexpr UnitLog kLog{storeCategory, "StoreCheck"};
 using Clock = std::chrono::steady_clock;
 
 // Short enough to delay the writer's checkpoints no longer than a commit takes on a slow disk. Long
-// enough to read some megabytes from a fast disk.
+// enough to read a few megabytes from a fast disk.
 constexpr std::chrono::milliseconds kSlice{20};
 constexpr std::chrono::milliseconds kShortestPause{1};
 constexpr std::chrono::milliseconds kBusyTimeout{250};

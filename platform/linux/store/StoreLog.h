@@ -13,7 +13,8 @@ inline LogCategory& storeCategory() {
   return category;
 }
 
-// Limits a log line that could come with every record to one a second. Belongs to one thread.
+// For a log line that every record could cause: lets at most one line a second pass. Belongs to one
+// thread.
 class OncePerSecond {
  public:
   // Returns true when the line may be logged now, which begins the next second of silence.

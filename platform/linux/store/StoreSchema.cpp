@@ -15,7 +15,7 @@ namespace {
 // once a transaction and once every 512 records. Readers use it to find a range of time, and
 // retention to find expired records.
 //
-// The view uses CROSS JOIN because SQLite does not reorder the tables of such a join: its rows come
+// The view uses CROSS JOIN because SQLite does not reorder the tables of such a join: its rows are
 // in the order in which the events were sent, without a sort.
 constexpr std::string_view kAnalyticsEvents = R"sql(
 CREATE TABLE event_names(

@@ -48,7 +48,8 @@ bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
     writer_ = Writer::kGathering;
     work_.waitUntil(mutex_, notBefore);
   }
-  // From here on, records that are added wake nobody. The writer looks for them before it sleeps.
+  // From here on, adding a record does not wake the writer, which checks for records before it
+  // sleeps.
   writer_ = Writer::kWorking;
   workingSince_ = clock_();
   const bool wasRequested = std::exchange(roundRequested_, false);
@@ -101,7 +102,7 @@ bool WriterQueue::noteAdded() {
   if (waiting_ >= softRecords_ && !backpressure_.isHigh()) backpressure_.raise();
   const bool wake =
       writer_ == Writer::kIdle || (writer_ == Writer::kGathering && queued_ >= gatherRecords_);
-  // One wake-up is enough, however many records come before the writer runs.
+  // One wake-up is enough, however many records are added before the writer runs.
   if (wake) writer_ = Writer::kWorking;
   return wake;
 }

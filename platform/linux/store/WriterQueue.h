@@ -81,7 +81,7 @@ class WriterQueue {
   void finish(std::uint64_t records, std::uint64_t bytes) HALVOX_EXCLUDES(mutex_);
   // Writer only. The time so far was spent on a failure: finish() must not count it as writing.
   void disregardTime() HALVOX_EXCLUDES(mutex_);
-  // Writer only. Returns true when records came after the last take().
+  // Writer only. Returns true when records were added after the last take().
   [[nodiscard]] bool hasQueued() HALVOX_EXCLUDES(mutex_);
 
   // Any thread. The number of records that were added and are not finished.

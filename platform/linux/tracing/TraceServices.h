@@ -18,8 +18,8 @@ namespace halvox::platform::linux_ {
 //   made --open()--> serving --stop()--> declining --close() or abandon()--> closed
 //
 // The steps are separate because the service ends in steps. stop() makes running traces end soon,
-// so that queues which wait for a trace can end; close() cleans the tracer up when no queue can
-// start a trace any more. The functions below run on the main thread and log what fails.
+// so that queues which wait for a trace can end. close() cleans the tracer up when no queue can
+// start another trace. The functions below run on the main thread and log what fails.
 class TraceServices {
  public:
   virtual ~TraceServices() = default;

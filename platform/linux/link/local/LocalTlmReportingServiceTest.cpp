@@ -93,7 +93,7 @@ TEST_F(LocalTlmReportingServiceTest, NameThatIsNoTextIsStoredAsItsDescription) {
 
 TEST_F(LocalTlmReportingServiceTest, NameThatIsTooLongIsCutBetweenCharacters) {
   startLink();
-  const std::string end = "\u00E9";  // two bytes, the second of which is one too many
+  const std::string end = "\u00E9";  // two bytes; the second is beyond the limit
   const auto session = link->TLMReportingCreateSession(
       sessionInfo(1), userInfo(std::string(254, 'a') + end + std::string(1'000'000, 'b')));
 

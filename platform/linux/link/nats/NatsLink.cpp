@@ -108,7 +108,8 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
   {
     const MutexLock lock(mutex_);
     error = refusal(message.bytes);
-    // Under this lock: after close() has begun, the queue gains no message that nobody would count.
+    // Take it under this lock: after close() has begun, no message must enter the queue, because it
+    // would not be counted.
     if (!error) error = publisher_.take(message);
     if (!error) {
       wakeThread();
@@ -201,7 +202,7 @@ bool NatsLink::hasConnection() const {
   return state_ != State::kIdle && state_ != State::kConnecting;
 }
 
-// Whether somebody needs a connection.
+// Whether a caller or a queued message needs a connection.
 bool NatsLink::isNeeded() { return !waiters_.empty() || publisher_.hasQueued(); }
 
 // After close(): whether no work or no time remains.

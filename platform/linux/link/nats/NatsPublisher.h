@@ -48,7 +48,7 @@ struct OutgoingMessage {
 // changes faster than a message travels to the server and back, a later message can be stored
 // before an earlier one.
 //
-// A probe that nobody responds to can mean that the stream was deleted or that its server lost its
+// A probe without a response can mean that the stream was deleted or that its server lost its
 // files. The publisher then creates the stream again. A message without an acknowledgement within
 // kAckTime of its first attempt is abandoned and counted as not acknowledged.
 //
@@ -68,9 +68,9 @@ class NatsPublisher {
   static constexpr std::chrono::milliseconds kResendPause{100};
   // The pause between two lookups of the stream. A lookup costs a cluster more than a probe.
   static constexpr std::chrono::seconds kStreamCheckPause{2};
-  // Bytes that wait while servers are away: as much as the largest request of a client, or about
-  // 37,000 messages of 886 bytes, the size of an ordinary one with its headers. A larger queue
-  // would delay the error by which a session learns that the link is broken.
+  // The bytes that may wait while servers are away: as many as the largest request of a client has,
+  // or about 37,000 ordinary messages of 886 bytes with headers. A larger queue would delay the
+  // error by which a session learns that the link is broken.
   static constexpr std::size_t kQueueBytes = 32U << 20U;
 
   // `wake` makes the link's thread look for work again.

@@ -92,7 +92,7 @@ Result<void, StoreError> EventFollower::deliverBy(Read read) {
   // filter lets none through, as with `newest` 0, all stored records would otherwise count as new
   // the next time.
   if (done) filter_.after = std::max(filter_.after, reader_.lastRead());
-  // Limits the first delivery only: all that comes later is new.
+  // `newest` limits only the first delivery: everything that is stored later is new.
   filter_.newest.reset();
   return done;
 }

@@ -15,7 +15,7 @@ using ::testing::IsEmpty;
 
 class EventFollowerTest : public StoreFixture {
  protected:
-  // Delivers until `count` events were seen in all. Returns false when they do not come in time.
+  // Delivers until `count` events were seen in all. Returns false when they do not arrive in time.
   bool follow(std::size_t count) {
     bool isReadable = true;
     const auto deliver = [&] {

@@ -44,7 +44,7 @@ Result<void, StoreError> StoreReader::open(const std::filesystem::path& director
         errno == ENOENT || errno == ENOTDIR ? StoreError::kMissing : StoreError::kCannotOpen;
     return Failure<StoreError>{kind, files_->database().native() + ": " + errnoText(errno)};
   }
-  // Opening a pipe would block until somebody writes to it.
+  // Opening a pipe would block until a program opens it for writing.
   if (!S_ISREG(status.st_mode)) {
     return Failure<StoreError>{
         StoreError::kCannotOpen,

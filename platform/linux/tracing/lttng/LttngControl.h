@@ -23,7 +23,7 @@ struct RecordingPlan {
 //
 //   no daemon --begin()--> daemon runs, recordings begin and end --close()--> no daemon
 //
-// The daemon is started by the first recording and ended with the service. One that somebody else
+// The daemon is started by the first recording and ended with the service. A daemon that others
 // started is used and left running.
 //
 // Names: a recording has the name of its LTTng session, which begins with the device and inode
@@ -59,7 +59,7 @@ class LttngControl {
   Result<void> end(const Recording& recording);
   // Deletes the files of a recording.
   void discard(const Recording& recording);
-  // Destroys all our sessions. Ends the daemon if we started it and nobody else uses it.
+  // Destroys all our sessions. Ends the daemon if we started it and no other program uses it.
   void close();
 
   [[nodiscard]] const std::filesystem::path& tracesDirectory() const { return tracesDirectory_; }

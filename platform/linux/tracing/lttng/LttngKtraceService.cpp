@@ -15,7 +15,7 @@ constexpr int kNotStarted = 1;
 constexpr int kNoRange = 2;
 constexpr int kUnsuitable = 3;  // no session, or not in the state for the call
 // A batch is one job of the queue. Large enough that the job costs little compared with its events,
-// and small enough that a few batches are some megabytes.
+// and small enough that a few batches take only a few megabytes.
 constexpr std::size_t kBatchEvents = 4096;
 
 // Events on their way to the queue. If the queue has ended with the service, the batch is destroyed

@@ -115,8 +115,8 @@ class LttngTraceSession final : public KQTraceSession,
   LttngTraceSession& operator=(const LttngTraceSession&) = delete;
   ~LttngTraceSession() override {
     if (!recording_.has_value()) return;
-    // Nobody holds the session: end the recording and delete it without calling the delegate. Do so
-    // on the queue, because ending a recording waits for the tracer.
+    // The session is no longer used: end the recording and delete it without calling the delegate.
+    // Do so on the queue, because ending a recording waits for the tracer.
     queue_->async(JobWeight::kMayBlock, [work = work_, recording = std::move(*recording_)] {
       work->givenUp.add();
       static_cast<void>(work->end(recording));

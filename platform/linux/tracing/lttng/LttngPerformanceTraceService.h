@@ -19,8 +19,8 @@ namespace halvox::platform::linux_ {
 //
 // Threads: all work, and all calls of delegates, are on one thread of the service, in the order of
 // the requests. The composition root owns the service.
-// Failure: logged, counted, and reported to the delegate. A trace whose session nobody holds any
-// more is deleted without a call, and a delegate that has been destroyed is not called.
+// Failure: logged, counted, and reported to the delegate. If the session is destroyed while it
+// records, the trace is deleted without a call. A delegate that has been destroyed is not called.
 class LttngPerformanceTraceService final : public PerformanceTraceService {
  public:
   // All three must outlive the service and the work of its sessions.

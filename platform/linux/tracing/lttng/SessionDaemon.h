@@ -38,8 +38,8 @@ class SessionDaemon {
   // session names; it must not be empty, or sessions of others would match.
   void adopt(const std::string& ownSessions);
   [[nodiscard]] bool isNoted() const;
-  // Ends our daemon if it does not answer any more, starts another and waits until that answers.
-  // Fails if it does not; then the daemon has been ended.
+  // Ends our daemon if it no longer answers, starts another and waits until that one answers. If it
+  // does not answer, ends it and fails.
   Result<void> start(const std::string& ownSessions);
   [[nodiscard]] bool isOurs() const { return process_.has_value(); }
   // Ends the daemon if it is ours, and waits until it has ended.

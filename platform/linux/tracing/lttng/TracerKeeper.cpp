@@ -31,8 +31,8 @@ std::string keeperPath() {
   return !error && std::filesystem::exists(beside, error) ? beside : installed;
 }
 
-// Reads one line, without its end. Empty if it does not come in time or the writer has gone. Reads
-// byte by byte: the line is short, and nothing after it may be consumed.
+// Reads one line, without its end. Empty if it does not arrive in time or the writer has closed the
+// pipe. Reads byte by byte: the line is short, and nothing after it may be consumed.
 std::string readLine(int descriptor, milliseconds within) {
   const auto deadline = steady_clock::now() + within;
   std::string line;

@@ -41,11 +41,11 @@ using namespace halvox::platform::linux_;
 constexpr unsigned kSecondsToAnswer = 10;
 constexpr std::chrono::seconds kEndsWithin{5};  // after SIGTERM; then it is killed
 
-volatile std::sig_atomic_t silentDaemon = 0;  // the daemon that is being asked; 0: none
+volatile std::sig_atomic_t silentDaemon = 0;  // the daemon whose answer is awaited; 0: none
 
-// The library waits for a daemon without limit. A daemon that hangs serves nobody. It is killed,
-// which also ends the wait. If the wait continues, it is for another daemon: the second alarm then
-// ends the keeper.
+// The library waits for a daemon without limit. A daemon that hangs is of no use to other programs
+// either. It is killed, which also ends the wait. If the wait continues, it is for another daemon:
+// the second alarm then ends the keeper.
 void onSilence(int /*signal*/) {
   const pid_t daemon = silentDaemon;
   if (daemon == 0) ::_exit(EXIT_FAILURE);
