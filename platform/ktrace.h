@@ -37,7 +37,7 @@ class KtraceSession {
 //        --destroy from any state--> destroyed
 //
 // Threads: a session belongs to the code that sets it up until it is started, and then to the queue
-// that it was started with. Its handlers run on that queue. It is ended and destroyed there too,
+// that it was started with. Its handlers run on that queue. It is also ended and destroyed there,
 // but not inside an event handler.
 //
 // Failure: a start that fails still counts as a start. A call that does not suit the session's

@@ -54,7 +54,7 @@ class KQTraceSession {
   virtual void stopKQTrace() = 0;
 };
 
-// Records and packages traces by itself. Any thread may call. The composition root owns the
+// Records and packages performance traces. Any thread may call. The composition root owns the
 // service. The spelling of the functions is part of the interface.
 class PerformanceTraceService {
  public:

@@ -6,7 +6,7 @@
 
 namespace halvox::platform {
 
-// The kernel's process number. The kernel reuses it after the process has ended.
+// The kernel's process ID. The kernel reuses it after the process has ended.
 using ProcessID = std::int32_t;
 
 // What the platform knows about a running process.

@@ -20,7 +20,7 @@ class PropertyListService {
   // The directory that relative paths start from.
   [[nodiscard]] virtual std::string currentDirectory() const = 0;
   // The whole content of a file; none, with `error` set, if it cannot be read completely. Reading
-  // and parsing are two calls because the caller logs each failure by itself and continues.
+  // and parsing are two calls because the caller logs each failure separately and continues.
   [[nodiscard]] virtual std::optional<Data> readFile(std::string_view path,
                                                      std::optional<Error>& error) const = 0;
   // The root of a property list in XML or binary form; none, with `error` set, if the bytes are not

@@ -63,7 +63,7 @@ class ProtoReader {
 
   // The varint at the position. A varint that the end cuts off sets the error flag and reads as 0.
   // A varint of more than ten bytes, which no 64-bit number needs, reads as 0 without an error, and
-  // decoding continues after the ten bytes. The difference is required.
+  // decoding continues after the ten bytes. This difference is required.
   [[nodiscard]] std::uint64_t readVarint();
   [[nodiscard]] Tag readTag();
   // Copies the string at the position to `value`. If the string is longer than the remaining bytes,

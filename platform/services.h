@@ -54,9 +54,9 @@ struct Services {
   TLMReportingService& tlmReporting;
 };
 
-// Installs the services: once, before anything else, while there is only one thread. Tests install
-// a new set for each test, at a moment when none of their other threads runs. Nothing is locked,
-// because these functions are called for every message.
+// Installs the services. Call it once, before anything else, while there is only one thread. Tests
+// install a new set for each test, while none of their other threads runs. There is no lock,
+// because the functions below are called for every message.
 void installServices(const Services& services);
 
 // The installed services. Any thread may call them after installServices(). A call before it is a

@@ -28,7 +28,7 @@ inline constexpr std::string_view kTLMReportingSessionInfoContainsRealtimeEvents
 inline constexpr std::string_view kTLMReportingSessionInfoClientBundleID =
     "TLMReportingSessionInfoClientBundleID";
 
-// Keys of the user info. Their texts are part of the interface too.
+// Keys of the user info. Their texts are also part of the interface.
 inline constexpr std::string_view kTLMReportingUserInfoClientName =
     "TLMReportingUserInfoClientName";
 inline constexpr std::string_view kTLMReportingUserInfoServiceName =

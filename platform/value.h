@@ -114,8 +114,8 @@ class Key {
   // Not secret: clients can make keys with equal hashes. See secretHash() for tables of client
   // keys.
   [[nodiscard]] std::uint32_t hash() const;
-  // True if the text has a space (U+0020). Stored in the node, because every message asks for every
-  // key.
+  // True if the text has a space (U+0020). Stored in the node, because it is read for every key of
+  // every message.
   [[nodiscard]] bool hasBlank() const;
   // True if all equal keys share this key's node for the life of the process.
   [[nodiscard]] bool isInterned() const;

@@ -21,7 +21,7 @@ namespace halvox::platform {
 // Any thread may call; the test reads on its own. FakePlatform owns it.
 class FakeAnalyticsService final : public AnalyticsService {
  public:
-  // kWhenSent: on another thread at once, as by a store whose writer is faster than the sender.
+  // kWhenSent: on another thread at once, like a store whose writer is faster than the sender.
   enum class Building : unsigned char { kWhenRead, kWhenTold, kWhenSent };
   struct Event {
     std::string name;

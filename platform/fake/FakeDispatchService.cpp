@@ -27,7 +27,7 @@ class RunningMark {
   }
 };
 
-// While a job waits, others may run on its thread.
+// Marks a thread whose job waits as one that runs no job: it may then run other jobs.
 class StandingMark {
  public:
   StandingMark() : wasRunning_(std::exchange(runningJob, false)), queue_(runningQueue) {

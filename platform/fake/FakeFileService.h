@@ -54,7 +54,7 @@ class FakeFileService final : public FileService {
   mutable std::mutex mutex_;
   std::optional<Error> directoryError_;
   std::optional<Error> fileError_;
-  std::set<std::string> known_;  // all directories that a call was to make
+  std::set<std::string> known_;  // all directories that were requested
   std::map<std::string, std::uint32_t> directories_;
   std::vector<File> files_;
   std::vector<std::string> steps_;

@@ -4,8 +4,8 @@
 
 namespace halvox::platform {
 
-// Whether two channels of the fake have the same names and format, by which a set of channels
-// identifies them.
+// Whether two channels of the fake have the same names and format, which identify a channel in a
+// set.
 [[nodiscard]] bool areNamedAlike(const FakeIOReportService::Channel& one,
                                  const FakeIOReportService::Channel& other);
 

@@ -163,7 +163,7 @@ void FakeKtraceService::ktrace_end(const Session& session, int reason) {
       if (!own->hasWalltimes) event.walltime = 0;
       own->deliver(event);
     }
-    // Moved out first: the handler may destroy the session, and with it itself.
+    // Move the handler out first: it may destroy the session, which would destroy the handler.
     if (const auto completion = std::exchange(own->completion, nullptr)) completion();
   });
 }

@@ -31,7 +31,8 @@ class FakeKtraceService final : public KtraceService {
   // Emits an event: the sessions that record now keep it if it is in their ranges.
   void emit(const trace_point& event);
   void setNanosecondsPerTick(std::uint64_t nanoseconds) { setTimebase(nanoseconds, 1); }
-  // That number of ticks takes that number of nanoseconds. Fractions of a nanosecond are cut off.
+  // Sets how many nanoseconds that many ticks take. A conversion cuts fractions of a nanosecond
+  // off.
   void setTimebase(std::uint64_t nanoseconds, std::uint64_t ticks);
   // Makes these calls fail with that error; 0 ends the failures.
   void failRange(int error);

@@ -9,8 +9,8 @@ namespace halvox::platform::linux_ {
 enum class ConnectionOpenError : std::uint8_t;
 enum class StoreError : std::uint8_t;
 
-// Why the service cannot start: one line for the user. The code is an exit status of sysexits.h, by
-// which scripts distinguish the kinds of reasons.
+// Why the service cannot start: one line for the user. The code is an exit status of sysexits.h,
+// which lets scripts distinguish the kinds of reasons.
 [[nodiscard]] Failure<int> startFailure(const Failure<StoreError>& failure);
 [[nodiscard]] Failure<int> startFailure(const Failure<ConnectionOpenError>& failure);
 

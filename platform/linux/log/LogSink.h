@@ -32,7 +32,8 @@ using JournalSender = std::function<int(const iovec* fields, int count)>;
 // Writes native journal entries. A line for which `sender` fails counts as not written.
 std::unique_ptr<LogSink> makeJournalLogSink(JournalSender sender);
 
-// Whether the descriptor is connected to the journal, by $JOURNAL_STREAM (see systemd.exec(5)).
+// Whether the descriptor is connected to the journal, according to $JOURNAL_STREAM
+// (systemd.exec(5)).
 bool isJournalStream(int descriptor);
 
 }  // namespace halvox::platform::linux_

@@ -15,7 +15,7 @@ namespace halvox::platform::linux_ {
 class QueuedLogService::Category final : public LogCategory {
  public:
   Category(QueuedLogService& service, std::string subsystem, std::string category)
-      // A line is wanted if it is to be written or to be kept.
+      // A line is wanted if it will be written or kept.
       : LogCategory(std::min(service.levels_.written,
                              service.levels_.kept.value_or(service.levels_.written))),
         service_(service),

@@ -11,7 +11,7 @@ namespace halvox::pipewire {
 namespace {
 
 // The stages of a node's work in a cycle, as the profiler numbers them. A node that was not even
-// called is not late itself: it waits for another node that is.
+// called is not late itself: it waits for another node that is late.
 constexpr std::int32_t kCalled = 1;
 constexpr std::int32_t kAwake = 2;
 constexpr std::int32_t kFinished = 3;

@@ -38,7 +38,7 @@ std::vector<std::filesystem::path> normal(std::vector<std::filesystem::path> pat
 
 std::error_code DirectoryWatch::arm(std::vector<std::filesystem::path> directories) {
   directories_ = normal(std::move(directories));
-  // The descriptors of the old instance mean nothing to the new one.
+  // The descriptors of the old instance are not valid for the new one.
   watches_.clear();
   isThere_.assign(directories_.size(), false);
   // A new instance, instead of removing watches one by one: the events of the old watches disappear

@@ -179,8 +179,8 @@ bool InotifyNotifyService::isNotifyLink(std::size_t directory, std::string_view 
   return directory >= first && notifyLinks_[directory - first].filename() == file;
 }
 
-// Logs that the notify directory was deleted, which explains why notifications stop, and that it is
-// back. A directory that was never created is not worth a line.
+// Logs when the notify directory is deleted, which explains why notifications stop, and when it
+// exists again. A directory that never existed is not logged.
 void InotifyNotifyService::logNotifyDirectory() {
   const bool isThere = watch_.isThere(kNotifyDirectory);
   if (isThere == std::exchange(hasNotifyDirectory_, isThere)) return;

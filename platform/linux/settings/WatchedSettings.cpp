@@ -41,8 +41,8 @@ WatchedSettings::WatchedSettings(std::filesystem::path notifyDirectory,
 
 std::optional<FileMark> WatchedSettings::mark(const std::string& name) const {
   struct stat status {};
-  // lstat, because a link that is replaced is a change too. The time of the last status change,
-  // because `touch -d` can set the other times.
+  // lstat, because replacing a link is also a change. The time of the last status change, because
+  // `touch -d` can set the other times.
   if (::lstat((notifyDirectory_ / name).c_str(), &status) != 0) return std::nullopt;
   return FileMark{status.st_ino, status.st_ctim.tv_sec * kNanoseconds + status.st_ctim.tv_nsec};
 }
@@ -68,7 +68,8 @@ void WatchedSettings::add(const std::string& name, SettingBaseline&& baseline) {
 void WatchedSettings::noteNotifyFile(std::string_view file) {
   const auto known = names_.known.find(file);
   if (known == names_.known.end()) return;
-  // The event is enough: a file that is deleted again before its state is read was a post, too.
+  // The event is enough: a file that is deleted again before its state is read also counts as a
+  // post.
   known->second.wasTouched = true;
   names_.news.insert(known->first);
 }
@@ -124,7 +125,7 @@ bool WatchedSettings::settleName(const std::string& name) {
   return isNews;
 }
 
-// A file that cannot be read is not a change. Listeners keep the values from before, and are
+// A file that cannot be read does not count as changed. Listeners keep the previous values, and are
 // notified when the file is fixed and has other values.
 bool WatchedSettings::settleDomain(const std::string& domain) {
   auto now = reader_.read(kPreferenceUser, domain);

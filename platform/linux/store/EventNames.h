@@ -20,8 +20,8 @@ struct EventName {
   std::uint64_t generation = 0;
 };
 
-// A table of the event names seen so far, each with the answer whether it is to be stored. Matching
-// the patterns for every message would be too slow. Owned by the store.
+// A table of the event names seen so far. Each entry says whether events of that name are stored.
+// Matching the patterns for every message would be too slow. Owned by the store.
 //
 // Any thread may call, and no call takes a lock: entries are added but never removed, and their
 // constant members never change. The table is bounded, because clients choose names. A name that

@@ -208,7 +208,7 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
       case TextKind::kEscapesNeeded:
         return addEscaped(text);
       case TextKind::kNotAscii:
-        // Texts that came from files or other processes may be anything. RapidJSON would copy their
+        // Texts from files or other processes may contain any bytes. RapidJSON would copy their
         // bytes, and readers would refuse the whole payload.
         return addEscaped(replaceInvalidUtf8(text));
     }

@@ -51,7 +51,7 @@ class OpenStore {
   std::unique_ptr<linux_::SqliteStore> store_;
 };
 
-// Takes the text up to the separator off the front of a row.
+// Removes the first column and its separator from a row, and returns the column.
 std::string takeColumn(std::string& row) {
   const std::size_t end = row.find('|');
   std::string column = row.substr(0, end);

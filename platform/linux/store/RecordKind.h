@@ -22,7 +22,7 @@ constexpr std::size_t kDropReasons = 7;
 // The name under which the drops of that reason are counted, such as "dropped: disk full".
 [[nodiscard]] std::string_view counterName(DropReason reason);
 
-// How much the open transaction may still take.
+// How much may still be added to the open transaction.
 struct TransactionAllowance {
   std::int64_t records;
   std::int64_t payloadBytes;

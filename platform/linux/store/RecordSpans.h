@@ -9,8 +9,8 @@
 namespace halvox::platform::linux_ {
 
 // Numbers the records of one kind and keeps the first and the last time of each span of
-// kRecordsPerSpan records. Deletes records from the oldest, by number or by time; the spans find
-// them without an index on the time.
+// kRecordsPerSpan records. Deletes the oldest records, by number or by time; the spans make an
+// index on the time unnecessary.
 // Owned by a RecordKind and used by the writer's thread only. Works in the open transaction, except
 // for prepare(). Functions that use the database return SQLITE_OK or an error.
 //

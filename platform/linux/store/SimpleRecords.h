@@ -79,7 +79,7 @@ class SimpleRecords final : public SimpleRecordKind {
     return taken_.size();
   }
   Bound bindRecord(std::size_t index, Statement& statement, PayloadEncoder& encoder) override {
-    // Frees the record before this one, so that memory shrinks while a large batch is written.
+    // Frees the previous record, so that memory shrinks while a large batch is written.
     bound_ = std::move(taken_[index]);
     return {bound_.time, bound_.bind(statement, kFirstColumn, encoder)};
   }

@@ -104,8 +104,8 @@ bool SqliteStore::hasTaken() const {
 // Opens the database if it is not open, or if its path now leads to another file or to none:
 // records in a file without a name would be lost. Returns false after dropping the taken records.
 bool SqliteStore::makeReady() {
-  // This costs one stat() for each transaction: SQLite does not notice that its file has lost its
-  // name.
+  // One stat() for each transaction is needed, because SQLite does not notice that its file has
+  // lost its name.
   if (database_.isOpen() && files_.identity() == identity_) return logHasRoom();
   if (database_.isOpen()) {
     kLog.error(files_.database().c_str(),
@@ -217,7 +217,7 @@ SqliteCode SqliteStore::prepareStatements() {
 SqliteCode SqliteStore::writeTransaction() {
   TransactionAllowance allowance{kRecordsPerTransaction,
                                  static_cast<std::int64_t>(sizes_.transactionBytes)};
-  // fail() reads it when SQLite itself has no error of the system to give.
+  // fail() reads errno when SQLite itself does not report the system's error.
   errno = 0;
   SqliteCode code = begin_.run();
   for (RecordKind* const kind : kinds_) {
@@ -295,8 +295,8 @@ void SqliteStore::closeDatabase() {
 }
 
 void SqliteStore::abandonDatabase() {
-  // The caller may rename the file that the check reads. The log stays, and with it a check that
-  // is not finished.
+  // The caller may rename the file that the check reads. The log stays, so that an unfinished check
+  // is repeated.
   static_cast<void>(check_.stop());
   releaseStatements();
   abandon(database_);

@@ -45,8 +45,7 @@ class StoreCheck {
   // and gives up.
   void begin(const std::string& file, const StoreExtent& extent, OnDamage onDamage);
   // Ends the thread and forgets its finding. Blocks for at most one slice. Returns false if the
-  // file that it was to check still needs a check. A further call returns true and does nothing
-  // else.
+  // check was not finished and must be repeated. Further calls do nothing and return true.
   bool stop();
   // Any thread. Describes the damage; std::nullopt while none was found.
   [[nodiscard]] std::optional<std::string> finding() HALVOX_EXCLUDES(mutex_);

@@ -97,7 +97,8 @@ Result<void, StoreError> StoreFiles::makeDatabaseFile() {
   if (sizeOf(database_) == 0 && logBytes() > 0) {
     if (auto log = setAside(); !log) return std::move(log).error();
   }
-  // SQLite would make it readable for all users. It gives its log the mode of the database.
+  // SQLite would make the database readable for all users. It gives the log the mode of the
+  // database.
   const UniqueFd made(::open(database_.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, kFileMode));
   if (made || errno == EEXIST) return {};
   return failure(StoreError::kDirectory, database_, "cannot create the database file", errno);

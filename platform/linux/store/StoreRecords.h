@@ -15,7 +15,7 @@ namespace halvox::platform::linux_ {
 // since 1970. Payloads wait as dictionaries; the writer encodes them, which keeps JSON off the
 // callers' threads.
 //
-// `bind` gives the columns of a record to the statement that inserts it and returns the number of
+// `bind` passes the columns of a record to the statement that inserts it, and returns the number of
 // bytes that count against the transaction. The record must outlive the statement's run.
 
 struct IssueMetricRecord {

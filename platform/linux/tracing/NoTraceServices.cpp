@@ -55,7 +55,7 @@ class NoKtraceService final : public KtraceService {
     if (ours == nullptr) return;
     ours->state = State::kEnded;
     ours->queue->async(JobWeight::kMayBlock, [ours] {
-      // Moved out first: the handler may destroy the session, which releases the handler.
+      // Move the handler out first: it may destroy the session, which would destroy the handler.
       if (const auto completion = std::exchange(ours->completion, nullptr)) completion();
     });
   }
@@ -71,7 +71,8 @@ class NoKtraceService final : public KtraceService {
   }
 };
 
-// Reports from its queue that it cannot start, because a delegate is never called inside a call.
+// Reports from its queue that it cannot start, because a delegate must not be called inside a call
+// to the session.
 class NoTraceSession final : public KQTraceSession,
                              public std::enable_shared_from_this<NoTraceSession> {
  public:

@@ -19,7 +19,7 @@ namespace halvox::platform::linux_ {
 //
 // The steps are separate because the service ends in steps. stop() makes running traces end soon,
 // so that queues which wait for a trace can end. close() cleans the tracer up when no queue can
-// start another trace. The functions below run on the main thread and log what fails.
+// start another trace. The functions below run on the main thread and log failures.
 class TraceServices {
  public:
   virtual ~TraceServices() = default;

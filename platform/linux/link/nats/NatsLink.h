@@ -81,7 +81,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
     std::uint64_t id;
     TLMReportingService::BackendsCallback found;
   };
-  // A caller that asked while a server was connected; the thread only has to call back.
+  // A call of discover() while a server was connected; the thread only has to call back.
   struct Answer {
     TLMReportingService::BackendsCallback found;
     Array servers;

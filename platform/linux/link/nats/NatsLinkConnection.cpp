@@ -11,9 +11,9 @@ namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
-// The library tries one server after the other, and one that accepts and stays silent takes its
-// whole time-out. All servers together get kServersTime and the stream two requests, 7.5 seconds:
-// the attempt ends before the callers of discover() give up (kDiscoveryTime).
+// The library tries one server after the other, and a server that accepts and stays silent takes
+// its whole time-out. All servers together get kServersTime, and the stream gets two requests. The
+// sum is 7.5 seconds: the attempt ends before the callers of discover() give up (kDiscoveryTime).
 constexpr std::chrono::milliseconds kServerTime{2000};
 constexpr std::chrono::milliseconds kShortestServerTime{100};
 constexpr std::chrono::milliseconds kServersTime{6000};

@@ -146,8 +146,8 @@ bool NatsPublisher::canPublish(Time now) {
 }
 
 NatsPublisher::Step NatsPublisher::nextStep(Time now) {
-  // Half a window at a time: to wake the thread for every acknowledgement costs more than the
-  // acknowledgement itself.
+  // Wait until half of the window is free: waking the thread for every acknowledgement costs more
+  // than the acknowledgement itself.
   if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
   // No message remains whose order a probe could keep.
   if (pending_.size() == 0) flow_ = Flow::kFlowing;

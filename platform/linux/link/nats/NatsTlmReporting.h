@@ -18,7 +18,7 @@ struct NatsEnvironment {
 // The real-time reporting framework over NATS with JetStream.
 class NatsTlmReporting : public TLMReportingService {
  public:
-  // Refuses further messages, publishes for up to 3 seconds what was accepted, calls back all
+  // Refuses further messages, publishes the accepted ones for up to 3 seconds, calls back all
   // callers that still wait, and ends the connection. Blocks for at most about 10 seconds. Call it
   // when no other thread uses the back-end. Returns false if a thread still waits for a server,
   // which the NATS client library cannot interrupt: the environment must then stay until the
@@ -27,7 +27,7 @@ class NatsTlmReporting : public TLMReportingService {
 };
 
 // Makes the back-end. It connects when the first session starts: a service whose sessions never
-// start needs no server. Only in the module and in programs that are linked with what it contains;
+// start needs no server. Call it only in the module and in programs that link the module's code;
 // the service uses loadNatsTlmReporting().
 [[nodiscard]] std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(
     Configuration::Link options, const NatsEnvironment& environment);

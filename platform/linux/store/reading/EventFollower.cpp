@@ -30,7 +30,7 @@ Failure<StoreError> systemFailure(const std::filesystem::path& directory) {
   return {kind, directory.native() + ": cannot watch the directory: " + errnoText(errno)};
 }
 
-// The -shm file does not count: readers write to it too, and the follower would wake itself.
+// The -shm file does not count: readers also write to it, and the follower would wake itself.
 bool isStoreFile(std::string_view name) {
   return name.starts_with(kStoreFileName) && !name.ends_with("-shm");
 }

@@ -23,8 +23,8 @@ struct RecordingPlan {
 //
 //   no daemon --begin()--> daemon runs, recordings begin and end --close()--> no daemon
 //
-// The daemon is started by the first recording and ended with the service. A daemon that others
-// started is used and left running.
+// The first recording starts the daemon, and close() ends it. A daemon that others started is used
+// and left running.
 //
 // Names: a recording has the name of its LTTng session, which begins with the device and inode
 // numbers of the traces' directory. One service at a time has that directory open. A session with
@@ -32,11 +32,11 @@ struct RecordingPlan {
 // destroyed.
 //
 // Files: each recording writes into a directory of its own below "scratch" in the traces'
-// directory. While it records, an empty file of its name is in the directory "recording" next to
-// "scratch". From the appearance of that file on, every event is recorded.
+// directory. While it records, an empty file with its name is in the directory "recording" next to
+// "scratch". As soon as that file exists, every event is recorded.
 //
-// Threads: any. Each call waits for the daemon, and calls wait for each other, because the control
-// library is not thread-safe. This lock is the only one here that is held during input and output.
+// Threads: any. Each call waits for the daemon. A lock makes calls wait for each other, because the
+// control library is not thread-safe. No other lock here is held during input and output.
 // Failure: a text for the log. The platform's trace services own this object.
 class LttngControl {
  public:

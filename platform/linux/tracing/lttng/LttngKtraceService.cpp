@@ -197,7 +197,7 @@ void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& sessi
   }
   // Added after all batches, on the same queue: the completion comes after the last event.
   session->queue->async(JobWeight::kMayBlock, [session] {
-    // Moved out first: the handler may destroy the session, which releases its handlers.
+    // Move the handler out first: it may destroy the session, which would destroy the handler.
     if (const auto completion = std::exchange(session->completion, nullptr)) completion();
   });
 }

@@ -33,9 +33,9 @@ class SessionDaemon {
   SessionDaemon(std::filesystem::path noteFile, Limits limits)
       : noteFile_(std::move(noteFile)), limits_(limits) {}
 
-  // Takes over the daemon that the file names if it still runs; deletes the file otherwise. Waits
-  // for the keeper of an earlier service that is still at work. `ownSessions` is the prefix of our
-  // session names; it must not be empty, or sessions of others would match.
+  // Takes over the daemon that the file names if it still runs; deletes the file otherwise. First
+  // waits for the keeper of an earlier service if that keeper still runs. `ownSessions` is the
+  // prefix of our session names; it must not be empty, or sessions of others would match.
   void adopt(const std::string& ownSessions);
   [[nodiscard]] bool isNoted() const;
   // Ends our daemon if it no longer answers, starts another and waits until that one answers. If it

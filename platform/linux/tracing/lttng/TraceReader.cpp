@@ -182,7 +182,7 @@ std::vector<std::string> traceDirectories(const std::filesystem::path& root) {
 // sink. Used once, by one thread.
 class TraceGraph {
  public:
-  // True if the graph can run. Otherwise the library has an error.
+  // True if the graph can run. Otherwise latestError() returns the reason.
   [[nodiscard]] bool build(const std::vector<std::string>& directories, Sink& sink) {
     // The plugins are looked up by name at run time; a machine may lack them.
     graph_.reset(bt_graph_create(0));

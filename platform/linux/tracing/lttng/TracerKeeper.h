@@ -50,7 +50,7 @@ class TracerKeeper {
   bool release();
 
  private:
-  // `daemon` has the number 0 if the keeper must start one.
+  // `daemon` has the process ID 0 if the keeper must start one.
   Result<DaemonProcess> launch(const Ward& ward, DaemonProcess daemon);
 
   std::optional<ChildProcess> keeper_;
