@@ -124,7 +124,7 @@ void FrameRing::pushCells(const Chain& chain) {
   std::uint64_t top = free_.load(std::memory_order_relaxed);
   std::uint64_t pushed = 0;
   do {
-    // kNoCell + 1 is 0.
+    // If no cell is free, this stores kNoCell, because kNoCell + 1 is 0.
     next(chain.last).store(static_cast<std::uint32_t>(top) - 1U, std::memory_order_relaxed);
     pushed = (top & ~std::uint64_t{UINT32_MAX}) + kChange + (chain.first + std::uint64_t{1});
   } while (!free_.compare_exchange_weak(top, pushed, std::memory_order_acq_rel,

@@ -47,7 +47,7 @@ class FrameRing {
   // Only the consumer may call the following functions.
   // The position of the oldest frame in the ring.
   [[nodiscard]] std::uint64_t head() const { return head_; }
-  // True if there is a frame and its producer has finished writing it.
+  // Returns true if there is a frame and its producer has finished writing it.
   [[nodiscard]] bool isReady() const;
   // The size of the oldest frame. Call this and take() only if isReady().
   [[nodiscard]] std::size_t frontBytes() const { return slot(head_).bytes; }

@@ -31,7 +31,7 @@ class ServiceStream {
   explicit ServiceStream(platform::linux_::UniqueFd connected);
 
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(fd_) && !ended_; }
-  // True once the service has agreed to the handshake.
+  // Returns true once the service has agreed to the handshake.
   [[nodiscard]] bool isReady() const { return ready_; }
   [[nodiscard]] int fd() const { return fd_.get(); }
   // True while appended bytes wait for send(), or for the socket to become writable.

@@ -15,8 +15,8 @@
 // pays for every function call. Only RequestEncoder.cpp includes it.
 namespace halvox::client {
 
-// True for ASCII without NUL, which nearly all texts are. Saves them the call of the full test,
-// which checks the last bytes one by one.
+// Returns true for ASCII without NUL, which nearly all texts are. Saves them the call of the full
+// test, which checks the last bytes one by one.
 inline bool isPlainText(std::string_view text) {
   constexpr std::uint64_t kEachByte = 0x0101010101010101;
   constexpr std::uint64_t kEachHighBit = 0x8080808080808080;

@@ -29,8 +29,7 @@ extern const int* const halvox_trace_state;
 void halvox_trace_emit(uint32_t code, uint64_t argument1, uint64_t argument2, uint64_t argument3,
                        uint64_t argument4);
 
-/* Emits one trace point if a trace runs. The arguments have the meaning that the program gives
- * them. */
+/* Emits one trace point if a trace runs. The program chooses the meaning of the arguments. */
 static inline void halvox_trace(uint32_t code, uint64_t argument1, uint64_t argument2,
                                 uint64_t argument3, uint64_t argument4) {
   /* Another thread may write the number at any time. One event more or less does not matter at that

@@ -30,8 +30,8 @@ struct ChildProgram {
   // session of its own also keeps the signals of our terminal away from it.
   enum class Group : std::uint8_t { kOurs, kOwnGroup, kOwnSession };
   // Threads of this program block all signals, and the program ignores some. A child that inherits
-  // this may not end when it should. kInherited is only for passing on what the caller of this
-  // program set, as nohup does.
+  // this may not end when it should. Use kInherited only to pass on the settings with which this
+  // program was started, such as those of nohup.
   enum class Signals : std::uint8_t { kReset, kInherited };
 
   std::vector<std::string> command;  // the program is searched for in PATH unless it has a slash

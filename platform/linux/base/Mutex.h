@@ -51,7 +51,7 @@ class HALVOX_THREAD_ANNOTATION(scoped_lockable) MutexLock {
 class Condition {
  public:
   void wait(Mutex& mutex) HALVOX_REQUIRES(mutex) { condition_.wait(mutex); }
-  // False when the deadline passed.
+  // Returns false if the deadline passed.
   bool waitUntil(Mutex& mutex, std::chrono::steady_clock::time_point deadline)
       HALVOX_REQUIRES(mutex) {
     return condition_.wait_until(mutex, deadline) == std::cv_status::no_timeout;

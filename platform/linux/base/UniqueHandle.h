@@ -29,12 +29,12 @@ class UniqueHandle {
 
   // Gives up the handle without calling `kRelease`.
   [[nodiscard]] Raw release() noexcept { return std::exchange(raw_, kNone); }
-  // Releases what is held and takes `raw` instead.
+  // Releases the old handle and takes `raw` instead.
   void reset(Raw raw = kNone) noexcept {
     const Raw old = std::exchange(raw_, raw);
     if (old != kNone && old != raw) static_cast<void>(kRelease(old));
   }
-  // Where a C function stores a new handle; what was held is released first.
+  // Returns where a C function can store a new handle. Releases the old handle first.
   [[nodiscard]] Raw* out() noexcept {
     reset();
     return &raw_;

@@ -24,14 +24,15 @@ struct Utf8Step {
 // Returns the character at the start of `text`, which must not be empty.
 [[nodiscard]] Utf8Step nextUtf8(std::string_view text);
 
-// True for valid UTF-8. Tests ASCII eight bytes at a time.
+// Returns true for valid UTF-8. Tests ASCII eight bytes at a time.
 [[nodiscard]] bool isUtf8(std::string_view text);
 
-// True for valid UTF-8 without a NUL, which is what D-Bus and C take as a text. It runs for every
-// message and therefore makes one pass: a separate search for the NUL would read the text twice.
+// Returns true for valid UTF-8 without a NUL, which is what D-Bus and C take as a text. It runs for
+// every message and therefore makes one pass: a separate search for the NUL would read the text
+// twice.
 [[nodiscard]] bool isUtf8WithoutNul(std::string_view text);
 
-// True for a byte that continues a character.
+// Returns true for a byte that continues a character.
 [[nodiscard]] constexpr bool continuesUtf8(char byte) {
   return (static_cast<unsigned char>(byte) & 0xC0U) == 0x80U;
 }

@@ -73,7 +73,7 @@ class LoopTimer final : public EventSource {
  public:
   enum class Before : std::uint8_t { kSleep, kNextTurn };
 
-  // False when the system gave no timer.
+  // Returns false if the system gave no timer.
   [[nodiscard]] bool open(EventLoop& loop);
   // Makes the loop wake up at `due`. A timer that is set too early stays as it is until it expires
   // and is set again. This saves a system call for most requests. A timer that is not needed any

@@ -28,10 +28,10 @@ class EventLoop {
   EventLoop(const EventLoop&) = delete;
   EventLoop& operator=(const EventLoop&) = delete;
 
-  // False when the system has no descriptor left.
+  // Returns false if the system has no descriptor left.
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(epoll_); }
 
-  // `events` are those of epoll(7). False when the system refuses one more.
+  // `events` are those of epoll(7). Returns false if the system refuses one more.
   [[nodiscard]] bool watch(int fd, std::uint32_t events, EventSource& source);
   void change(int fd, std::uint32_t events, EventSource& source);
   void forget(int fd);

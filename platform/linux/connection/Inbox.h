@@ -46,7 +46,7 @@ struct Mail {
 class Inbox final : public EventSource {
  public:
   Inbox();
-  // False when the system has no descriptor left.
+  // Returns false if the system has no descriptor left.
   [[nodiscard]] bool watchWith(EventLoop& loop);
 
   // From any thread.
@@ -54,7 +54,7 @@ class Inbox final : public EventSource {
   void postRoom(std::shared_ptr<ClientLink> client);
   void postRelief();
   void postStop();
-  // True on the thread that runs the loop.
+  // Returns true on the thread that runs the loop.
   [[nodiscard]] bool isLoopThread() const;
 
   // On the I/O thread.

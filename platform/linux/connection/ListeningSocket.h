@@ -25,7 +25,7 @@ class ListeningSocket final : public EventSource, private DeadlineOwner {
   ListeningSocket(const ListeningSocket&) = delete;
   ListeningSocket& operator=(const ListeningSocket&) = delete;
 
-  // False when the socket cannot be watched.
+  // Returns false if the socket cannot be watched.
   [[nodiscard]] bool start();
   // One of our connections has closed its descriptor.
   void tryAgain();

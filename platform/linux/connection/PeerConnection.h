@@ -45,7 +45,7 @@ class PeerConnection final : public ClientConnection, private StreamOwner, priva
   void onOutputProgress() override { onOutputRoom(); }
   void onDeadline() override;
 
-  // True when the handshake is complete and messages follow.
+  // Returns true if the handshake is complete and messages follow.
   bool continueHandshake();
 
   SocketStream stream_;

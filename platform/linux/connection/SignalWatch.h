@@ -17,7 +17,7 @@ class SignalWatch final : public EventSource {
 
   // SIGTERM and SIGINT call `onEnd`. SIGUSR1 calls `onReport`, which may be empty.
   SignalWatch(std::function<void()> onEnd, std::function<void()> onReport);
-  // False when the system has no descriptor left.
+  // Returns false if the system has no descriptor left.
   [[nodiscard]] bool start(EventLoop& loop);
   void onReady(std::uint32_t events) override;
 

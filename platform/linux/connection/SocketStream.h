@@ -48,7 +48,8 @@ class SocketStream final : public EventSource {
   void outputAdded();
   // Writes. Called by the host at the end of the turn.
   void flush();
-  // Closes the descriptor, and drops the output and what is added later. False if it was closed.
+  // Closes the descriptor, and drops the output and whatever is added later. Returns false if it
+  // was already closed.
   bool close();
 
   void onReady(std::uint32_t events) override;

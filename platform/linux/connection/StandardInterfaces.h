@@ -79,7 +79,7 @@ class StandardInterfaces {
   const ServiceIdentity& identity_;
 };
 
-// True when `path` is a parent of `objectPath`. The root is a parent of all others.
+// Returns true if `path` is a parent of `objectPath`. The root is a parent of all others.
 bool isParentPath(std::string_view path, std::string_view objectPath);
 
 }  // namespace halvox::platform::linux_

@@ -27,15 +27,16 @@ class TurnSchedule {
   // The client delivers after the store has caught up.
   void deliverWhenRelieved(std::shared_ptr<ClientConnection> client);
   void flushLater(SocketStream& stream);
-  // The client, which has ended, finishes in the next turn, after its last replies were written.
+  // Finishes a client that has ended. Does so in the next turn, after the client's last replies
+  // were written.
   void finishNext(std::shared_ptr<ClientConnection> client);
   // Call before anything that can queue jobs: a delivery, a handler, an acceptance. Begins the
   // batch.
   void beforeDelivery();
 
-  // True when the next turn must not sleep.
+  // Returns true if the next turn must not sleep.
   [[nodiscard]] bool hasWork() const;
-  // How many requests each client may have delivered in this turn.
+  // The most requests that may be delivered for one client in this turn.
   [[nodiscard]] std::size_t requestsPerClient() const { return requestsPerClient_; }
 
   // The parts of a turn, in this order. `readyCount` is the number of sources that had events.

@@ -14,8 +14,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// What the programs need to find PipeWire and to print text. Nothing else of the service's
-// environment reaches them.
+// The variables that the programs need to find PipeWire and to print text. They get nothing else
+// from the service's environment.
 constexpr std::array kPassedVariables{
     "PATH", "HOME", "LANG", "XDG_RUNTIME_DIR", "PIPEWIRE_REMOTE", "PIPEWIRE_RUNTIME_DIR"};
 
@@ -82,7 +82,7 @@ Finding runProgram(const std::vector<std::string>& command, std::size_t most,
     return Finding::failed(isMissing ? command.front() + " is not installed"
                                      : child.error().message);
   }
-  // While this process has a copy of the writing end, reading never comes to an end.
+  // Close our copy of the writing end: while it is open, reading never reaches the end.
   pipe->writer.reset();
   Finding finding;
   const ReadEnd end = readOutput(pipe->reader.get(), most, deadline, finding.bytes);
@@ -92,7 +92,7 @@ Finding runProgram(const std::vector<std::string>& command, std::size_t most,
       return Finding::failed(command.front() + ": " + ended->text());
     }
   }
-  // The whole group: the program may have started others that hold the pipe.
+  // Kill the whole group: the program may have started others that hold the pipe.
   child->kill();
   if (end == ReadEnd::kTooMuch) {
     finding.isCut = true;

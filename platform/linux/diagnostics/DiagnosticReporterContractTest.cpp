@@ -1,4 +1,4 @@
-// The contract of diagnostic reporters, kept by the service that captures.
+// Tests the contract of diagnostic reporters on the service that captures snapshots.
 
 #include "platform/fake/contracts/DiagnosticReporterContract.h"
 
@@ -10,7 +10,7 @@
 namespace halvox::platform::contract {
 namespace {
 
-// A service on fakes in a scratch directory.
+// A service that uses fakes and a scratch directory.
 class SnapshotHarness : private linux_::SnapshotFixture {
  public:
   SnapshotHarness() { start(); }

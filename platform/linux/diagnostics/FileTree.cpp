@@ -12,8 +12,8 @@ namespace fs = std::filesystem;
 // is arbitrary, would decide which files are beyond the bounds.
 std::vector<fs::path> filesBelow(const fs::path& root, const TreeBounds& bounds,
                                  const CaptureDeadline& deadline, Tree& tree) {
-  // Directories and other entries count too: a tree that has hardly any files must not be walked to
-  // its end.
+  // Directories and other entries count too: a large tree with hardly any files must not be walked
+  // to its end.
   constexpr std::size_t kLooksPerFile = 16;
   std::vector<fs::path> paths;
   std::size_t looks = 0;
@@ -50,7 +50,7 @@ Tree readTree(const fs::path& root, const TreeBounds& bounds, const CaptureDeadl
       break;
     }
     Finding finding = readBounded(path, std::min(bounds.bytesOfFile, room));
-    // One file that cannot be read costs only itself.
+    // A file that cannot be read does not affect the others.
     if (!finding.isCollected()) {
       ++tree.unreadable;
       continue;

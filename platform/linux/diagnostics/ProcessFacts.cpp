@@ -63,7 +63,8 @@ class Facts {
     add(key, replaceInvalidUtf8(finding.bytes));
   }
   [[nodiscard]] Dictionary take() {
-    // A capture says what is missing and why. A reader could otherwise take it for absent.
+    // A capture says what could not be read, and why. Otherwise a reader could conclude that it
+    // does not exist.
     if (!failures_.empty()) facts_.set("not_readable", failures_);
     return std::move(facts_);
   }
@@ -188,7 +189,8 @@ Dictionary processFacts(const fs::path& procRoot, std::string_view name,
   std::vector<Value> processes;
   for (const std::int32_t pid : numberedEntries(procRoot, kMostOpenFiles, error)) {
     if (deadline.hasPassed()) break;
-    // By name, because that is all that a signature has. Several processes may have it.
+    // Search by name, because a signature has nothing else. Several processes may have the same
+    // name.
     if (commandName(procRoot / std::to_string(pid)) != name) continue;
     ++found;
     if (processes.size() < kMostProcesses) processes.emplace_back(factsOf(procRoot, pid));

@@ -61,8 +61,7 @@ SnapshotArchive::~SnapshotArchive() {
 }
 
 Result<void> SnapshotArchive::open() {
-  // Removes the file of a service that was killed. O_EXCL then makes sure that the new file is
-  // ours.
+  // Remove the file that a killed service left. O_EXCL then ensures that the new file is ours.
   ::unlink(path_.c_str());
   writer_->file.reset(
       ::open(path_.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC | O_NOFOLLOW, kMode));
@@ -101,7 +100,8 @@ Result<void> SnapshotArchive::finish() {
   writer_->handle.reset();
   if (auto done = written(); !done) return done;
   struct stat status {};
-  // Before the archive gets its name: after a power cut, one with a name must be complete.
+  // Sync before the archive gets its name: after a power cut, an archive with a name must be
+  // complete.
   if (::fsync(writer_->file.get()) != 0 || ::fstat(writer_->file.get(), &status) != 0) {
     return Failure<>{path_.native() + ": " + errnoText(errno)};
   }

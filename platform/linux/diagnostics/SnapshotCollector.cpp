@@ -67,8 +67,8 @@ void SnapshotCollector::addSignature() {
   addPart("signature.json", [this] { return Finding{.bytes = json(request_.signature)}; });
 }
 
-// Omitted when a request has nothing but its signature. The duration is only noted, because a
-// snapshot shows one moment.
+// Omit this part if a request has nothing but its signature. The duration is only recorded, because
+// a snapshot shows one moment.
 void SnapshotCollector::addRequest() {
   if (!request_.event && !request_.payload && request_.durationSeconds == 0) return;
   addPart("request.json", [this] {
@@ -165,12 +165,12 @@ void SnapshotCollector::addPart(const char* name, const std::function<Finding()>
   if (isOver()) return;
   const Clock::time_point begun = Clock::now();
   Finding finding = deadline_.hasPassed() ? Finding::failed("the time limit was reached") : find();
-  // A capture that the end of the service cuts short is dropped as a whole.
+  // If the end of the service interrupts a capture, the whole capture is dropped.
   if (deadline_.stop().isRaised()) {
     result_ = Failure<>{"the service is ending"};
     return;
   }
-  // The manifest must fit in the end, or nobody would know what is missing.
+  // Leave room for the manifest, which says what is missing.
   if (finding.isCollected() && archive_.roomLeft() < finding.bytes.size() + kRoomForManifest) {
     finding = Finding::failed("the size limit of the archive was reached");
   }

@@ -39,16 +39,16 @@ struct SnapshotSources {
 
 // Collects the parts of one snapshot into an archive. The last part is a manifest, which lists each
 // part with its size and the time that it took, or with the reason why it is missing. A part that
-// cannot be collected, or for which no time or room remains, is not a failure of the snapshot.
-// Made for one snapshot, and used by the thread that takes it.
+// cannot be collected, or for which no time or room remains, is not a failure of the snapshot. Made
+// for one snapshot. Belongs to the thread that takes it.
 class SnapshotCollector {
  public:
   // Does not own its arguments, which must outlive it.
   SnapshotCollector(const SnapshotRequest& request, const SnapshotSources& sources,
                     SnapshotArchive& archive, const CaptureDeadline& deadline);
 
-  // Collects all parts; call it once. Collects until the deadline at most, but may block longer on
-  // the disk. Fails when the archive cannot be written or the service is ending.
+  // Collects all parts; call it once. Stops collecting at the deadline, but may block longer on the
+  // disk. Fails if the archive cannot be written or the service is ending.
   Result<void> collect();
 
  private:

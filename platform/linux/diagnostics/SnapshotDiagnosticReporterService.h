@@ -20,7 +20,7 @@ struct SnapshotOptions {
   std::filesystem::path storageDirectory;
   std::uint32_t keep = defaults::kKeptSnapshots;  // the number of newest snapshots to keep
   std::uint64_t mostBytes = 64U << 20U;           // the size of one, before compression
-  // When this time is over, what was collected is written.
+  // After this time, the service stops collecting and writes the snapshot.
   std::chrono::milliseconds collectWithin{8000};
   std::chrono::milliseconds stateWithin{2000};  // for the service's state
   std::chrono::milliseconds dumpWithin{3000};   // for the dump of PipeWire
@@ -47,7 +47,7 @@ struct SnapshotPartners {
 // When a snapshot fails, no file remains and an error is logged, at most one a second. The next
 // request tries again.
 //
-// Owned by the platform. Any thread may call. Reporters may outlive the service.
+// Owned by the platform. Any thread may use it. Reporters may outlive the service.
 class SnapshotDiagnosticReporterService final : public DiagnosticReporterService {
  public:
   SnapshotDiagnosticReporterService(SnapshotOptions options, SnapshotPartners partners);

@@ -27,7 +27,7 @@ class SnapshotDiagnosticReporterServiceTest : public SnapshotFixture {
  protected:
   SnapshotDiagnosticReporterServiceTest() { platform.clock.setCurrentDate({kNoon}); }
 
-  // A state source that answers only when the test says so.
+  // A state source that answers only when the test releases it.
   void holdState() {
     service->setStateSource([this](const auto& callback) { asked_.set_value(callback); });
   }
@@ -231,7 +231,7 @@ TEST_F(SnapshotDiagnosticReporterServiceTest, StopDuringASnapshotAnswersAndLeave
   EXPECT_LT(std::chrono::steady_clock::now() - begun, std::chrono::seconds(5));
   EXPECT_EQ(textOf(responseOf(std::move(response)), "error"), "the service is ending");
   EXPECT_THAT(names(), IsEmpty());
-  answer({});  // must do no harm, although it is late
+  answer({});  // a late answer must do no harm
   expectBalance();
 }
 

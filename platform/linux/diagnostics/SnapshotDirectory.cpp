@@ -129,7 +129,7 @@ Result<fs::path> SnapshotDirectory::publish(Date time, std::string_view type,
     const fs::path to = path_ / name;
     error = renameToFree(temporaryPath(), to);
     if (error != 0) continue;
-    // The new name is not on the disk before its directory is.
+    // Sync the directory: until then the new name is not on the disk.
     syncDirectory(path_);
     return to;
   }
@@ -143,7 +143,7 @@ std::vector<fs::path> SnapshotDirectory::newestFirst() const {
   for (; !error && at != fs::directory_iterator(); at.increment(error)) {
     const std::string name = at->path().filename().string();
     struct stat status {};
-    // Anything else in the directory was put there by others, and is never deleted.
+    // All other files in the directory belong to others and are never deleted.
     if (!isSnapshotName(name) || ::lstat(at->path().c_str(), &status) != 0 ||
         !S_ISREG(status.st_mode)) {
       continue;
@@ -153,7 +153,7 @@ std::vector<fs::path> SnapshotDirectory::newestFirst() const {
                    .modified = status.st_mtim.tv_sec * kNanoseconds + status.st_mtim.tv_nsec,
                    .path = at->path()});
   }
-  // By the time in the name and not by that of the file, which copying or restoring changes.
+  // Sort by the time in the name. The time of the file changes when it is copied or restored.
   std::ranges::sort(all, [](const Named& left, const Named& right) {
     return std::tie(left.stamp, left.modified, left.path) >
            std::tie(right.stamp, right.modified, right.path);
@@ -167,7 +167,7 @@ std::vector<fs::path> SnapshotDirectory::newestFirst() const {
 void SnapshotDirectory::keepNewest(std::size_t count, const fs::path& justWritten) const {
   std::size_t kept = 1;  // the one just written
   for (const fs::path& path : newestFirst()) {
-    // Kept even if others look newer: the clock may have been set back.
+    // Keep this one even if others look newer: the clock may have been set back.
     if (path == justWritten) continue;
     if (kept < count) {
       ++kept;

@@ -13,7 +13,7 @@ namespace halvox::platform::linux_ {
 
 // The directory that holds the snapshots: names them, deletes old ones, and removes the unfinished
 // file of a service that was killed. Remembers nothing between calls, because the directory may be
-// deleted at any time. Any thread may call. All functions except path() and temporaryPath() block
+// deleted at any time. Any thread may use it. All functions except path() and temporaryPath() block
 // on the disk.
 class SnapshotDirectory {
  public:

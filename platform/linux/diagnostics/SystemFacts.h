@@ -19,8 +19,8 @@ struct SystemPaths {
 };
 
 // Collects the versions of the kernel, the distribution and the sound servers. Those that cannot be
-// found are listed under "not_readable" with the reason. Runs a program, so it blocks for up to one
-// second, or until the deadline if that is earlier.
+// found are listed under "not_readable" with the reason. Runs a program, and therefore blocks for
+// up to one second, or until the deadline if that is earlier.
 [[nodiscard]] Dictionary systemFacts(const SystemPaths& paths, const CaptureDeadline& deadline);
 
 }  // namespace halvox::platform::linux_

@@ -11,7 +11,8 @@ namespace halvox::platform::linux_ {
 WaitableFlag::WaitableFlag() : event_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
 
 void WaitableFlag::raise() {
-  // Before the descriptor becomes readable: a thread that wakes up must find the flag raised.
+  // Raise the flag before the descriptor becomes readable: a thread that wakes up must find it
+  // raised.
   raised_.store(true, std::memory_order_release);
   const std::uint64_t one = 1;
   static_cast<void>(!::write(event_.get(), &one, sizeof one));

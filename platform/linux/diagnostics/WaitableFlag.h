@@ -15,7 +15,8 @@ class WaitableFlag {
  public:
   WaitableFlag();
 
-  // Never blocks. What this thread wrote before is visible to threads that see the flag raised.
+  // Raises the flag. Never blocks. A thread that sees the flag raised also sees everything that
+  // this thread wrote before.
   void raise();
   [[nodiscard]] bool isRaised() const { return raised_.load(std::memory_order_acquire); }
   // Readable (poll) once the flag is raised. Owned by the flag; -1 if there is none.

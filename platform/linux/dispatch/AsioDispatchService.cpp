@@ -19,7 +19,7 @@ AsioDispatchService::AsioDispatchService(LogService& log, StatisticsService& sta
       runner_(std::make_shared<JobRunner>(log, statistics)),
       pool_(std::make_shared<DispatchPool>(runner_, statistics)) {}
 
-// A year stands for no limit. The time at which it ends can still be computed.
+// A year stands for no limit: unlike the maximum, it can be added to the current time.
 AsioDispatchService::~AsioDispatchService() { stop(std::chrono::hours(24 * 365)); }
 
 std::shared_ptr<DispatchQueue> AsioDispatchService::createSerialQueue(std::string_view label,
@@ -48,7 +48,7 @@ void AsioDispatchService::holdPool() { DispatchThread::current().holdPool(); }
 void AsioDispatchService::wakePool() { DispatchThread::current().wakePool(); }
 
 void AsioDispatchService::finish(std::chrono::milliseconds limit) {
-  wakePool();  // for the turns that this thread still holds back
+  wakePool();  // starts the turns that this thread still holds back
   pool_->waitUntilIdle(std::chrono::steady_clock::now() + limit);
 }
 
@@ -58,7 +58,8 @@ bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
   {
     const MutexLock lock(mutex_);
     isStopped_ = true;
-    // A copy: waiting for them under the lock would block a job that makes a queue, for ever.
+    // Copy the list: waiting for the queues under the lock would block a job that makes a queue
+    // forever.
     queues = ownThreadQueues_;
   }
   for (const auto& queue : queues) queue->stop();
@@ -73,7 +74,7 @@ bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
     logStuck(stuck);
     return false;
   }
-  // Not when a job still runs: it may use what the discarded jobs hold.
+  // Do not destroy the jobs while another one still runs: it may use what they hold.
   pool_->discardJobs();
   const MutexLock lock(mutex_);
   ownThreadQueues_.clear();
@@ -88,7 +89,7 @@ void AsioDispatchService::logStuck(const std::vector<std::string>& labels) {
   log_.write(LogLevel::kError, detail::logPrefix("AsioDispatchService", __LINE__) + text);
 }
 
-// Null when the system has no thread to give or the service has stopped. The caller then uses the
+// Null if the system cannot start a thread or the service has stopped. The caller then uses the
 // pool, which discards the jobs if the service has stopped.
 std::shared_ptr<DispatchQueue> AsioDispatchService::createOwnThreadQueue(std::string_view label,
                                                                          QualityOfService quality) {

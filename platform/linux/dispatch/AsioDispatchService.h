@@ -22,33 +22,32 @@ class OwnThreadQueue;
 // nothing to do. A job that throws is logged and counted, and its queue continues. A shared queue
 // that waits on a semaphore costs memory, not a thread.
 //
-//   running --stop(): no job runs any more, waiting ones are discarded--> stopped
+//   running --stop(): ends after the running jobs, discards the waiting ones--> stopped
 //
 // Owned by the platform, which stops it before the services that jobs use are destroyed. Any thread
-// may call, unless a function says otherwise.
+// may call its functions, unless a comment says otherwise.
 //
 // Quality of service: utility and background work runs at a lower scheduling priority. A thread
 // cannot raise its priority again without a privilege, so the pool has threads for each quality,
 // made when they are first needed. What requests wait for must not have a lower quality than the
 // requests. The label of a queue names its own thread, or counts the jobs of shared queues: a stuck
-// queue has more jobs added than run, and is named in the log when it keeps the service from
-// ending.
+// queue has more jobs added than run, and the log names it if it keeps the service from ending.
 //
 // Helping: the I/O thread, which delivers a batch of requests, does so between beginHelping() and
-// endHelping(). Brief jobs that it adds meanwhile to a queue with its own thread wake nobody. At
-// the end it runs them itself, unless the own thread is at work or a job that may block is in front
-// of them. A brief request then costs no switch of threads. The queue stays serial and keeps the
-// order of its jobs. docs/decisions/0002 has the reasons.
+// endHelping(). Brief jobs that it adds meanwhile to a queue with its own thread do not wake that
+// thread. At the end the I/O thread runs them itself, unless the queue's own thread is working or a
+// job that may block is in front of them. A brief request then costs no switch of threads. The
+// queue stays serial and keeps the order of its jobs. docs/decisions/0002 has the reasons.
 //
 // Holding the pool: jobs that a thread adds to shared queues between holdPool() and wakePool()
 // start at wakePool(). Many jobs then wake the pool once, after the answers to the requests are
 // written. When each message woke the pool, the service took 1.61 times the processor time of a
-// bare echo where it now takes 1.07 times (docs/measurements.md). A queue with its own thread does
-// the same while it runs brief jobs.
+// bare echo; now it takes 1.07 times (docs/measurements.md). A queue with its own thread does the
+// same while it runs brief jobs.
 class AsioDispatchService final : public DispatchService {
  public:
-  // Both services must outlive this one and its queues. Throws std::system_error when the system
-  // has no threads or descriptors to give.
+  // Both services must outlive this one and its queues. Throws std::system_error if the system has
+  // no threads or descriptors left.
   AsioDispatchService(LogService& log, StatisticsService& statistics);
   // Stops, and waits for the running jobs without a limit.
   ~AsioDispatchService() override;
@@ -58,8 +57,8 @@ class AsioDispatchService final : public DispatchService {
   std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals) override;
   void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) override;
 
-  // For the calling thread. Each begin needs its end, on the same thread and soon: the jobs wait
-  // for it.
+  // These apply to the calling thread. Call the matching end on the same thread and soon: the jobs
+  // wait for it.
   void beginHelping();
   void endHelping();
   void holdPool();
@@ -70,9 +69,9 @@ class AsioDispatchService final : public DispatchService {
   // not due. Must not be called from a job.
   void finish(std::chrono::milliseconds limit);
   // Ends all threads after the jobs that they run. All other jobs, and those added later, are
-  // discarded and counted. Waits at most for `limit`. False when a job still runs then: the queues
-  // are named in the log, and the process should end without destroying this. May be called again.
-  // Must not be called from a job.
+  // discarded and counted. Waits at most for `limit`. Returns false if a job still runs then. The
+  // log then names the queues, and the process should end without destroying this object. May be
+  // called again. Must not be called from a job.
   bool stop(std::chrono::milliseconds limit);
 
  private:

@@ -88,7 +88,7 @@ TEST_F(AsioDispatchServiceTest, JobThatThrowsIsLoggedAndCountedAndTheQueueGoesOn
   for (const auto threading : {QueueThreading::kOwnThread, QueueThreading::kShared}) {
     const auto queue = createQueue(threading);
     queue->async(JobWeight::kBrief, [] { throw std::runtime_error("out of luck"); });
-    queue->async(JobWeight::kBrief, [] { throw 7; });  // of no exception class
+    queue->async(JobWeight::kBrief, [] { throw 7; });  // not a std::exception
     EXPECT_TRUE(drain(*queue));
   }
 
@@ -187,7 +187,7 @@ TEST_F(AsioDispatchServiceTest, StopDiscardsWaitingJobsAndCountsThem) {
     EXPECT_TRUE(service.stop(kTestDeadline));
     releaser.join();
 
-    // The release may have come before the stop: what did not run was discarded.
+    // The release may have come before the stop: every job either ran or was discarded.
     EXPECT_EQ(count("jobs discarded at the stop") - before + static_cast<std::uint64_t>(ran), 11U);
     EXPECT_TRUE(watched.expired());
   }
@@ -232,7 +232,7 @@ TEST_F(AsioDispatchServiceTest, QueuesMayOutliveTheService) {
 
 class AsioDispatchWaitTest : public AsioDispatchServiceTest {
  protected:
-  // Lets so many queues of their own wait on the semaphore, and returns when all do.
+  // Makes that many queues wait on the semaphore, and returns when all of them wait.
   void letQueuesWait(AsioDispatchService& service, int queues,
                      std::optional<std::chrono::nanoseconds> timeout) {
     const auto semaphore = semaphore_;
@@ -247,7 +247,7 @@ class AsioDispatchWaitTest : public AsioDispatchServiceTest {
     }
     ASSERT_TRUE(eventually([&] { return begun_ == queues; }));
   }
-  // How often the pool's threads began to run so far.
+  // Returns how often the pool's threads have started to run so far.
   static long wakeUps() {
     long sum = 0;
     for (const auto& task : std::filesystem::directory_iterator("/proc/self/task")) {

@@ -44,7 +44,7 @@ DelayedJobs::Ticket DelayedJobs::add(std::chrono::nanoseconds delay, QualityOfSe
     return ticket;
   }
   jobs_.emplace(ticket, Delayed{quality, std::move(job)});
-  // Only for a new earliest job. The timer is set once and not for each job.
+  // Set the timer only for a new earliest job, not for each job.
   if (!armedFor_.has_value() || due < *armedFor_) arm();
   return ticket;
 }
@@ -56,8 +56,8 @@ void DelayedJobs::cancel(const Ticket& ticket) {
   if (place == jobs_.end()) return;
   cancelled = std::move(place->second);
   jobs_.erase(place);
-  // A timer that nobody needs would wake the idle service: that of a wait that ended early once
-  // did, nine seconds after each start of a session.
+  // A timer that is not needed any more would wake the idle service. The timer of a wait that had
+  // ended early once did, nine seconds after each start of a session.
   if (jobs_.empty() || (armedFor_.has_value() && jobs_.begin()->first.first > *armedFor_)) arm();
 }
 
@@ -98,7 +98,8 @@ void DelayedJobs::onTimer() {
   const MutexLock lock(mutex_);
   if (isStopped_) return;
   std::uint64_t expirations = 0;
-  // Nothing can be read if the timer was set again after it had expired. It then expires again.
+  // If the timer was set again after it had expired, there is nothing to read, and the timer will
+  // expire again.
   if (::read(timer_.native_handle(), &expirations, sizeof(expirations)) > 0) {
     const Time now = std::chrono::steady_clock::now();
     while (!jobs_.empty() && jobs_.begin()->first.first <= now) {

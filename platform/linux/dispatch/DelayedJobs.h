@@ -23,22 +23,23 @@ class DispatchPool;
 // threads watch the timer, because background jobs, which may take long, must not delay it.
 //
 // Owned by the pool. Any thread may add jobs. Due jobs run on the pool's threads of their quality,
-// in no order with others. The number of jobs has no bound: what waits is charged to clients. No
-// pool thread may run when this is destroyed.
+// in no particular order relative to other jobs. The number of jobs has no bound: what waits is
+// charged to clients. No pool thread may run when this is destroyed.
 class DelayedJobs {
  public:
-  // Names a job. Sorted by the time when it is due, then by the order of adding.
+  // A ticket names a job. Tickets are sorted by the time when the job is due, then by the order in
+  // which the jobs were added.
   using Time = std::chrono::steady_clock::time_point;
   using Ticket = std::pair<Time, std::uint64_t>;
 
-  // Throws std::system_error when the system has no descriptor to give.
+  // Throws std::system_error if the system has no descriptor left.
   explicit DelayedJobs(DispatchPool& pool);
 
   // Runs the job after the delay. A negative delay counts as 0, one above ten years as ten years.
   Ticket add(std::chrono::nanoseconds delay, QualityOfService quality, Job job);
   // Destroys a job that is not due yet. Does nothing to a job that is about to run or has run.
   void cancel(const Ticket& ticket);
-  // Discards and counts all jobs, and those added later.
+  // Discards and counts all jobs, including those that are added later.
   void stop();
 
  private:

@@ -35,7 +35,7 @@ asio::io_context& DispatchPool::context(QualityOfService quality) {
 }
 
 void DispatchPool::waitUntilIdle(std::chrono::steady_clock::time_point deadline) {
-  // Before the first look at turns_: from here on, the last turn to end reports it.
+  // Set this before the first look at turns_: from here on, the last turn that ends reports it.
   isAwaited_.store(true);
   const MutexLock lock(mutex_);
   while (turns_.load() > 0 && idle_.waitUntil(mutex_, deadline)) {
@@ -49,8 +49,8 @@ void DispatchPool::reportIdle() {
 
 void DispatchPool::stop() {
   isStopped_.store(true, std::memory_order_relaxed);
-  // Waits before timers and timers before threads: each could otherwise still hand work to the
-  // next.
+  // Stop the waits first, then the timers, then the threads: each could otherwise still give work
+  // to the next.
   waits_.stop();
   delayedJobs_.stop();
   for (PoolThreads* const threads : {&urgent_, &utility_, &background_}) threads->stop();

@@ -19,15 +19,15 @@ namespace halvox::platform::linux_ {
 
 // The threads on which all shared queues and delayed jobs run, a group for each quality of service.
 // The utility threads start with the pool, because they watch the timer. The others start with the
-// first job for them. If the system has no more threads to give, the utility threads do their work.
+// first job for them. If the system has no threads left, the utility threads do their work.
 //
 //   running --stop()--> stopping --waitForEnd()--> ended --discardJobs()--> empty
 //
 // Shared by the service, the shared queues and the semaphores, which may outlive the service. The
-// service stops it. Any thread may call.
+// service stops it. Any thread may use it.
 class DispatchPool {
  public:
-  // Throws std::system_error when the system has no threads to give. `statistics` must outlive it.
+  // Throws std::system_error if the system has no threads left. `statistics` must outlive it.
   DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService& statistics);
   DispatchPool(const DispatchPool&) = delete;
   DispatchPool& operator=(const DispatchPool&) = delete;
@@ -44,19 +44,19 @@ class DispatchPool {
   // Relaxed: jobs that are added during the stop may be run or discarded.
   [[nodiscard]] bool isStopped() const { return isStopped_.load(std::memory_order_relaxed); }
 
-  // Queues report each turn: when they ask for it, and when they have nothing left to run.
+  // A queue reports each turn: when it requests the turn, and when it has nothing left to run.
   void beginTurn() { turns_.fetch_add(1); }
   void endTurn() {
     if (turns_.fetch_sub(1) == 1 && isAwaited_.load()) reportIdle();
   }
-  // Waits until no queue has a job that can run now, at most until that time. Does not wait for
+  // Waits until no queue has a job that can run now, at most until `deadline`. Does not wait for
   // queues that wait on semaphores, nor for delayed jobs that are not due.
   void waitUntilIdle(std::chrono::steady_clock::time_point deadline);
 
   // Lets the threads end after the jobs that they run. From now on no wait ends.
   void stop();
-  // Waits for the end of the threads, at most until that time. False when a job still runs then.
-  // Call after stop().
+  // Waits for the end of the threads, at most until `deadline`. Returns false if a job still runs
+  // then. Call after stop().
   bool waitForEnd(std::chrono::steady_clock::time_point deadline);
   // Destroys the discarded jobs and waits. Needed because they may hold queues, which hold the
   // pool. Call after waitForEnd() has returned true.
@@ -68,7 +68,7 @@ class DispatchPool {
   const std::shared_ptr<JobRunner> runner_;
   QueueLabels labels_;
   // Sequentially consistent with each other: either waitUntilIdle() sees that the last turn has
-  // ended, or endTurn() sees that somebody waits.
+  // ended, or endTurn() sees that a thread waits.
   std::atomic<std::int64_t> turns_{0};
   std::atomic<bool> isAwaited_{false};
   Mutex mutex_;

@@ -21,20 +21,21 @@ DispatchThread& DispatchThread::current() {
 }
 
 DispatchThread::~DispatchThread() {
-  // In this order, because helped jobs may add turns.
+  // End helping first, because helped jobs may add turns.
   endHelping();
   wakePool();
 }
 
 void DispatchThread::endHelping() {
   std::size_t left = kHelpedJobsLimit;
-  // By index: helped jobs can note further queues, which moves the elements.
+  // Loop by index: helped jobs can note further queues, which moves the elements.
   for (std::size_t index = 0; index < queuesToHelp_.size(); ++index) {
     const std::shared_ptr<OwnThreadQueue> queue = std::move(queuesToHelp_[index]);
     left -= queue->help(*this, left);
   }
   queuesToHelp_.clear();
-  // After the loop: queues to which helped jobs add brief jobs are helped in it too.
+  // Clear this after the loop: queues to which helped jobs add brief jobs are helped in the loop,
+  // too.
   isHelping_ = false;
 }
 

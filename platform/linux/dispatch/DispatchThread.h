@@ -18,13 +18,12 @@ class SharedQueue;
 //   helping: off --beginHelping()--> on --endHelping(): runs the brief jobs it added--> off
 //   holding: off --holdPool()--> on --wakePool(): begins the noted turns--> off
 //
-// This is the only thread-local of the adapter. It has to be one: DispatchQueue::async() cannot be
-// given the batch that its caller is in, because the inner ring, which calls it, knows of none.
-// Belongs to its thread; no other thread may touch it. Ends what is still open when the thread
-// ends.
+// This is the only thread-local of the adapter. It has to be one: the inner ring calls
+// DispatchQueue::async(), and knows no batch that it could pass. Belongs to its thread; no other
+// thread may touch it. When the thread ends, it ends helping and holding if they are still on.
 class DispatchThread {
  public:
-  // The calling thread's own.
+  // Returns the calling thread's object.
   static DispatchThread& current();
 
   DispatchThread() = default;
@@ -65,8 +64,8 @@ class DispatchThread {
   }
 
   [[nodiscard]] bool isHoldingPool() const { return isHoldingPool_; }
-  // A thread that holds the pool must not wait for anything that it gave to the pool, which has not
-  // been woken for it.
+  // A thread that holds the pool must not wait for its own jobs in the pool: the pool has not been
+  // woken for them.
   void holdPool() { isHoldingPool_ = true; }
   // Begins the noted turns, in the order of the notes.
   void wakePool();
@@ -77,7 +76,7 @@ class DispatchThread {
   std::string_view label_;  // owned by the maker of the innermost Working
   bool isHelping_ = false;
   bool isHoldingPool_ = false;
-  // Both keep their capacity from batch to batch.
+  // Both keep their capacity between batches.
   std::vector<std::shared_ptr<OwnThreadQueue>> queuesToHelp_;
   std::vector<std::shared_ptr<SharedQueue>> turns_;
 };

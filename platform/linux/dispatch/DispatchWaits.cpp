@@ -24,15 +24,15 @@ void DispatchWaits::begin(std::shared_ptr<SharedQueue> queue,
     const MutexLock lock(mutex_);
     outcome = tryEnd(semaphore, timeout, wait);
   }
-  // Outside the lock: resume() takes the lock of the queue, and holding one at a time needs no
-  // order.
+  // Call it outside the lock: resume() takes the lock of the queue, and locks that are held one at
+  // a time need no order.
   if (outcome.has_value()) resume(std::move(wait), *outcome);
 }
 
 std::optional<WaitOutcome> DispatchWaits::tryEnd(const std::shared_ptr<SharedSemaphore>& semaphore,
                                                  std::optional<std::chrono::nanoseconds> timeout,
                                                  Wait& wait) {
-  // A signal that was kept wins over a time-out of zero: the wait has what it waits for.
+  // A stored signal takes precedence over a time-out of zero.
   if (!isStopped_ && semaphore->signals_ > 0) {
     --semaphore->signals_;
     return WaitOutcome::kSignalled;
@@ -40,7 +40,8 @@ std::optional<WaitOutcome> DispatchWaits::tryEnd(const std::shared_ptr<SharedSem
   if (!isStopped_ && timeout.has_value() && timeout->count() <= 0) return WaitOutcome::kTimedOut;
   const std::uint64_t number = begun_++;
   if (!isStopped_ && timeout.has_value()) {
-    // Weak: the wait keeps its semaphore alive. The time-out of a wait that has ended must not.
+    // Hold the semaphore weakly: the wait keeps it alive, and the time-out of a wait that has ended
+    // must not.
     wait.timeout = delayedJobs_.add(*timeout, QualityOfService::kUtility,
                                     [this, weakSemaphore = std::weak_ptr(semaphore), number] {
                                       timeOut(weakSemaphore, number);
@@ -87,7 +88,7 @@ void DispatchWaits::timeOut(const std::weak_ptr<SharedSemaphore>& weakSemaphore,
   resume(std::move(wait), WaitOutcome::kTimedOut);
 }
 
-// The caller must hold the semaphore: its last wait may be its last owner.
+// The caller must own the semaphore: its last wait may be its last owner.
 DispatchWaits::Wait DispatchWaits::take(SharedSemaphore& semaphore, Waits::iterator place) {
   Wait wait = std::move(place->second);
   semaphore.waits_.erase(place);
@@ -118,8 +119,8 @@ void DispatchWaits::discard() {
       semaphore->waits_.clear();
     }
   }
-  // Outside the lock, like the end of `semaphores`: what they hold may signal while it is
-  // destroyed.
+  // Destroyed outside the lock, like `semaphores`: the objects that they hold may signal in their
+  // destructors.
   runner_.countDiscarded(discarded.size());
   for (const Wait& wait : discarded) wait.queue->discardJobs();
 }

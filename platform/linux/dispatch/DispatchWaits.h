@@ -27,9 +27,9 @@ class SharedSemaphore;
 //           --none--> waiting --signal() or time-out--> the queue continues
 //                             --discard()--> the queue's jobs are discarded
 //
-// Owned by the pool. Any thread may call. One mutex for all semaphores: waits are as rare as starts
-// and stops of sessions. The number of waits is bounded by the number of queues, since each waits
-// once.
+// Owned by the pool. Any thread may use it. One mutex serves all semaphores: waits are as rare as
+// starts and stops of sessions. The number of waits is bounded by the number of queues, because
+// each queue has at most one.
 class DispatchWaits {
  public:
   using Then = std::function<void(WaitOutcome)>;
@@ -38,25 +38,25 @@ class DispatchWaits {
     Then then;
     std::optional<DelayedJobs::Ticket> timeout;
   };
-  // By number: the first one began first.
+  // Sorted by number: the first wait began first.
   using Waits = std::map<std::uint64_t, Wait>;
 
   // Both must outlive this.
   DispatchWaits(DelayedJobs& delayedJobs, JobRunner& runner)
       : delayedJobs_(delayedJobs), runner_(runner) {}
 
-  // The queue must not run a job until its resume() is called, which can happen before this
-  // returns.
+  // The queue must not run a job until its resume() is called. That can happen before this returns.
   void begin(std::shared_ptr<SharedQueue> queue, const std::shared_ptr<SharedSemaphore>& semaphore,
              std::optional<std::chrono::nanoseconds> timeout, Then then);
-  // Ends the wait that began first. Without one, keeps the signal.
+  // Ends the wait that began first. If there is none, stores the signal.
   void signal(SharedSemaphore& semaphore);
-  // Blocks the calling thread until a signal is kept, and consumes it. Waits of queues come first.
+  // Blocks the calling thread until a signal is stored, and consumes it. Waits of queues get
+  // signals first.
   void block(SharedSemaphore& semaphore);
   // From now on no wait ends.
   void stop();
-  // Destroys the waits with what they hold, and the jobs of their queues. Call after stop(), when
-  // no job runs any more.
+  // Destroys the waits, the objects that they hold, and the jobs of their queues. Call after
+  // stop(), when no job runs any more.
   void discard();
 
  private:
@@ -78,7 +78,7 @@ class DispatchWaits {
 };
 
 // The signals that no wait has consumed yet, and the waits for the next ones. Shared by the code
-// that signals and the code that waits. Any thread may call.
+// that signals and the code that waits. Any thread may use it.
 class SharedSemaphore final : public DispatchSemaphore,
                               public std::enable_shared_from_this<SharedSemaphore> {
  public:
@@ -95,7 +95,7 @@ class SharedSemaphore final : public DispatchSemaphore,
   // Guarded by the mutex of the pool's DispatchWaits. One of the two is always empty.
   std::uint64_t signals_;
   DispatchWaits::Waits waits_;
-  Condition signalled_;  // a signal was kept
+  Condition signalled_;  // a signal was stored
 };
 
 }  // namespace halvox::platform::linux_

@@ -1,4 +1,4 @@
-// How a thread that delivers requests helps the queues that it adds them to.
+// Tests how a thread that delivers requests runs jobs of the queues to which it adds them.
 
 #include <algorithm>
 #include <array>
@@ -55,7 +55,7 @@ class HelpingTest : public ::testing::Test {
       return state == 'S';
     });
   }
-  // A job that notes the thread that runs it.
+  // A job that records the thread that runs it.
   static Job noteThread(ThreadIDs& threads) {
     return [&threads] { threads.push_back(std::this_thread::get_id()); };
   }
@@ -264,8 +264,8 @@ TEST_F(HelpingTest, QueueDroppedWithinABatchRunsItsJobs) {
   EXPECT_EQ(ran.get_future().wait_for(kTestDeadline), std::future_status::ready);
 }
 
-// What one queue of the trial below saw. Only its jobs touch it. It is not atomic, so that
-// ThreadSanitizer reports two jobs that run at once.
+// The jobs that one queue of the test below has run. Only its jobs touch it. It is not atomic, so
+// that ThreadSanitizer reports two jobs that run at once.
 struct Record {
   static constexpr std::size_t kAdders = 6;
   std::array<int, kAdders> last{};

@@ -1,4 +1,4 @@
-// How many jobs for the pool's queues wake it once.
+// Tests that many jobs for the pool's queues wake the pool only once.
 
 #include <atomic>
 #include <future>
@@ -24,7 +24,7 @@ class HoldingTest : public ::testing::Test {
   static bool isSet(std::future<void>& event) {
     return event.wait_for(kTestDeadline) == std::future_status::ready;
   }
-  // Lets another thread's jobs go through the whole pool, many times.
+  // Sends jobs of another thread through the whole pool, many times.
   bool passJobs() {
     bool passed = true;
     std::thread other([this, &passed] {

@@ -9,7 +9,7 @@
 namespace halvox::platform::linux_ {
 
 // Runs jobs for the queues and catches what they throw. Shared by all queues of a service, because
-// queues can outlive the service. Any thread may call.
+// queues can outlive the service. Any thread may use it.
 class JobRunner {
  public:
   // Both services must outlive the runner.

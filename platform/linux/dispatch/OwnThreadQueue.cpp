@@ -46,7 +46,7 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
     if (hasWorker_) return;  // the worker looks for new jobs before it ends its work
     // The helper has noted this queue already and will find the job.
     if (mayHelp && helper_ == &helper) return;
-    // One helper at a time. For a job of a second thread, the own thread is woken.
+    // There is only one helper at a time. For a job of a second thread, wake the own thread.
     isNewForHelper = mayHelp && helper_ == nullptr;
     if (isNewForHelper) {
       helper_ = &helper;
@@ -54,7 +54,7 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
       mustWake = takeWakeUp();
     }
   }
-  // Both after the lock is released: a thread that wakes up needs it at once.
+  // Do both after the lock is released: a thread that wakes up needs it at once.
   if (isNewForHelper) helper.noteQueueToHelp(shared_from_this());
   if (mustWake) wakeUp_.notifyOne();
 }
@@ -111,8 +111,8 @@ void OwnThreadQueue::work(DispatchThread& thread) {
     while (takeBatch()) {
       mutex_.unlock();
       while (canGoOn()) runNextInBatch(thread);
-      // At the end of each batch: this thread may sleep now, and the turns that it holds back with
-      // it.
+      // Wake the pool at the end of each batch. This thread may sleep now, and must not hold back
+      // turns meanwhile.
       thread.wakePool();
       mutex_.lock();
     }
@@ -120,8 +120,8 @@ void OwnThreadQueue::work(DispatchThread& thread) {
   }
 }
 
-// Consecutive brief jobs wake the pool once. Before a job that may block, the pool is woken: the
-// job may wait for what an earlier one handed to the pool.
+// Consecutive brief jobs wake the pool once. Before a job that may block, wakes the pool: the job
+// may wait for work that an earlier job gave to the pool.
 void OwnThreadQueue::runNextInBatch(DispatchThread& thread) {
   if (batch_[next_].weight == JobWeight::kBrief) {
     thread.holdPool();
@@ -131,7 +131,7 @@ void OwnThreadQueue::runNextInBatch(DispatchThread& thread) {
   runNext();
 }
 
-// Discards the jobs that a stop left in the batch, and reports the end of the thread.
+// Discards the jobs that remain in the batch after a stop, and reports the end of the thread.
 void OwnThreadQueue::end() {
   if (next_ < batch_.size()) runner_->countDiscarded(batch_.size() - next_);
   batch_.clear();
@@ -140,10 +140,10 @@ void OwnThreadQueue::end() {
   ended_.notifyAll();
 }
 
-// Waits until there are jobs and no other worker. False when the thread should end.
+// Waits until there are jobs and no other worker. Returns false if the thread should end.
 bool OwnThreadQueue::waitForWork() {
   while (hasWorker_ || !hasWork()) {
-    // Not while a helper works. It wakes this thread when it is done.
+    // Do not end while a helper works. It wakes this thread when it has finished.
     if (!hasWorker_ && life_ != Life::kOpen) return false;
     sleeps_ = true;
     wakeUp_.wait(mutex_);
@@ -158,7 +158,8 @@ std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit
   bool mustWake = false;
   {
     const MutexLock lock(mutex_);
-    // First: jobs that are added from now on must note the queue again or wake its thread.
+    // Clear this first: a job that is added from now on must note the queue again or wake its
+    // thread.
     if (helper_ == &helper) helper_ = nullptr;
     if (hasWorker_ || !hasWork()) return 0;
     hasWorker_ = true;
@@ -174,7 +175,8 @@ std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit
       isFront = next_ == batch_.size();
     }
     hasWorker_ = false;
-    // Also without work after close() or stop(): the own thread has waited for this to end.
+    // After close() or stop(), wake it even without work: the own thread has waited for this
+    // helper.
     mustWake = (hasWork() || life_ != Life::kOpen) && takeWakeUp();
   }
   if (mustWake) wakeUp_.notifyOne();
@@ -185,20 +187,21 @@ bool OwnThreadQueue::hasWork() const {
   return life_ != Life::kStopped && (!waiting_.empty() || next_ < batch_.size());
 }
 
-// Moves the waiting jobs into the batch, unless the batch has some left. False when there are none
-// to run.
+// Moves the waiting jobs into the batch, unless the batch still has jobs. Returns false if there
+// are none to run.
 bool OwnThreadQueue::takeBatch() {
   if (!hasWork()) return false;
   if (next_ < batch_.size()) return true;
   batch_.clear();
   next_ = 0;
-  // Before the swap: the emptied vector is the one to which jobs are added next.
+  // Do this before the swap: jobs are added next to the vector that is empty now.
   if (batch_.capacity() > kKeptCapacity) batch_.shrink_to_fit();
   batch_.swap(waiting_);
   return true;
 }
 
-// True when the caller must notify the own thread: it sleeps, and nobody else is waking it.
+// Returns true if the caller must notify the own thread: it sleeps, and no other thread is waking
+// it.
 bool OwnThreadQueue::takeWakeUp() { return std::exchange(sleeps_, false); }
 
 bool OwnThreadQueue::canGoOn() const {
@@ -206,8 +209,8 @@ bool OwnThreadQueue::canGoOn() const {
 }
 
 void OwnThreadQueue::runNext() {
-  // Moved out first, so that what the job holds is released as soon as the job has run: a request's
-  // token must not wait for the end of the batch.
+  // Move the job out first. What it holds is then released as soon as it has run: a request's token
+  // must not wait for the end of the batch.
   const Job job = std::move(batch_[next_++].job);
   runner_->run(job);
 }

@@ -24,8 +24,8 @@ namespace halvox::platform::linux_ {
 // echo of the request needs in all (docs/decisions/0002). A thread that runs jobs, the own thread
 // or a helper, first becomes the queue's worker. There is at most one worker, which is what makes
 // the queue serial. The worker takes all waiting jobs in one batch: a batch costs one lock, and two
-// vectors that keep their capacity. A worker that leaves jobs behind wakes the own thread, so no
-// job is forgotten:
+// vectors that keep their capacity. A worker that leaves jobs in the queue wakes the own thread. No
+// job is therefore forgotten:
 //
 //   no worker --takes a batch--> worker --no job is left--> no worker
 //                                   \--the limit, or a job that may block, is reached-->
@@ -39,7 +39,7 @@ namespace halvox::platform::linux_ {
 class OwnThreadQueue final : public DispatchQueue,
                              public std::enable_shared_from_this<OwnThreadQueue> {
  public:
-  // Starts the thread. Throws std::system_error when the system has none to give.
+  // Starts the thread. Throws std::system_error if the system has no thread left.
   static std::shared_ptr<OwnThreadQueue> start(std::string label, QualityOfService quality,
                                                std::shared_ptr<JobRunner> runner);
   // Stops, and waits for the thread. Must not run on that thread.
@@ -53,14 +53,15 @@ class OwnThreadQueue final : public DispatchQueue,
   [[nodiscard]] const std::string& label() const { return label_; }
   [[nodiscard]] bool isCurrent() const override { return DispatchThread::current().worksFor(this); }
 
-  // Lets the thread end after all jobs have run. Nobody may add jobs from now on.
+  // Lets the thread end after all jobs have run. No jobs may be added from now on.
   void close();
   // Lets the thread end after the job that is running. Discards the waiting jobs and those that are
   // added later.
   void stop();
-  // True once the thread touches nothing any more: joining it takes no time.
+  // Returns true once the thread has done its last work: joining it then takes no time.
   [[nodiscard]] bool hasEnded() const;
-  // Waits for the end of the thread, at most until that time. False when it has not ended by then.
+  // Waits for the end of the thread, at most until `deadline`. Returns false if it has not ended by
+  // then.
   bool waitForEnd(std::chrono::steady_clock::time_point deadline);
 
   // Runs the brief jobs at the front of the queue on the calling thread, at most `limit` of them.
@@ -101,13 +102,15 @@ class OwnThreadQueue final : public DispatchQueue,
   bool sleeps_ HALVOX_GUARDED_BY(mutex_) = false;
   Life life_ HALVOX_GUARDED_BY(mutex_) = Life::kOpen;
   bool hasEnded_ HALVOX_GUARDED_BY(mutex_) = false;
-  // The thread that will help with the jobs that it added. While it is set, its jobs wake nobody.
+  // The thread that will help with the jobs that it added. While it is set, its jobs do not wake
+  // the own thread.
   const DispatchThread* helper_ HALVOX_GUARDED_BY(mutex_) = nullptr;
-  // Relaxed: `life_` decides. This only ends a batch early, without a lock for each job.
+  // Relaxed, because `life_` decides. This only ends a batch early without taking the lock for each
+  // job.
   std::atomic<bool> isStopped_{false};
 
-  // Belong to the worker. The mutex, under which a thread becomes the worker, orders its use of
-  // them after the last worker's.
+  // These belong to the worker. A thread becomes the worker under the mutex, which orders its use
+  // of them after that of the previous worker.
   std::vector<Item> batch_;
   std::size_t next_ = 0;
 

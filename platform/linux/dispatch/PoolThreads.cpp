@@ -38,7 +38,7 @@ bool PoolThreads::provide() {
   } catch (const std::system_error&) {
     if (threads_.empty()) return false;
   }
-  // With one thread as well: a second one is not tried again for each job.
+  // Set this even with one thread: do not try to start a second one for each job.
   areThere_.store(true, std::memory_order_relaxed);
   return true;
 }
@@ -64,7 +64,7 @@ void PoolThreads::join() {
   std::vector<std::thread> threads;
   {
     const MutexLock lock(mutex_);
-    // Joined after the lock is released: a thread takes it as its last step.
+    // Join them after the lock is released: each thread takes the lock in its last step.
     threads.swap(threads_);
   }
   for (std::thread& thread : threads) thread.join();

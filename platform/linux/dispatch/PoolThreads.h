@@ -21,7 +21,7 @@ namespace halvox::platform::linux_ {
 //
 //   no threads --provide()--> running --stop()--> stopping --waitForEnd()--> ended
 //
-// Idle threads sleep without a time-out. Owned by the pool. Any thread may call.
+// Idle threads sleep without a time-out. Owned by the pool. Any thread may use it.
 class PoolThreads {
  public:
   explicit PoolThreads(QualityOfService quality) : quality_(quality) {}
@@ -32,15 +32,15 @@ class PoolThreads {
 
   // Their run queue. What is posted before there are threads waits in it.
   [[nodiscard]] asio::io_context& context() { return context_; }
-  // Starts the threads unless they run. One is enough if the system refuses the second. False when
-  // it refuses both, and after stop(). The caller must not have a lower priority than this quality:
-  // a new thread starts with the priority of the thread that makes it.
+  // Starts the threads unless they run. One is enough if the system refuses the second. Returns
+  // false if it refuses both, and after stop(). The caller must not have a lower priority than this
+  // quality: a new thread starts with the priority of the thread that makes it.
   bool provide() HALVOX_EXCLUDES(mutex_);
 
   // Lets the threads end after the jobs that they run.
   void stop() HALVOX_EXCLUDES(mutex_);
-  // Waits for the end of the threads, at most until that time. False when a job still runs then.
-  // Call after stop().
+  // Waits for the end of the threads, at most until `deadline`. Returns false if a job still runs
+  // then. Call after stop().
   bool waitForEnd(std::chrono::steady_clock::time_point deadline) HALVOX_EXCLUDES(mutex_);
   // Runs what is left in the run queue; each entry sees the stop and discards its jobs. Call after
   // waitForEnd() has returned true.

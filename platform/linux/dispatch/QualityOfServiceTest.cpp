@@ -19,7 +19,7 @@
 #include "platform/linux/testing/Eventually.h"
 #include "platform/linux/testing/NoThreadsToHave.h"
 
-// What qualities of service and labels of queues do.
+// Tests the effects of qualities of service and of the labels of queues.
 namespace halvox::platform::linux_ {
 namespace {
 
@@ -28,7 +28,8 @@ using ::testing::HasSubstr;
 
 int nicenessHere() { return ::getpriority(PRIO_PROCESS, static_cast<id_t>(::gettid())); }
 
-// That of a thread so many steps below this one; the tests may be run with a low priority too.
+// Returns the niceness of a thread that many steps below this one. The tests may themselves run at
+// a low priority.
 int stepsBelow(int steps) { return std::min(nicenessHere() + steps, 19); }
 
 bool hasThreadNamed(const std::string& name) {

@@ -19,13 +19,13 @@ struct QueueLabel {
   std::string_view text{};  // owned by the QueueLabels
   Counter& added;
   Counter& run;
-  // How many of the queues are having a turn. Relaxed: it is only read to name stuck queues.
+  // How many of the queues have a turn. Relaxed: it is only read to name stuck queues.
   std::atomic<int> atWork{0};
 };
 
-// The labels of the shared queues. One for each text. They are never removed: texts are constants
-// of the code, and all sessions share one. Owns the labels; belongs to the pool. Any thread may
-// call.
+// The labels of the shared queues, one for each text. Labels are never removed: their texts are
+// constants of the code, which all sessions share. Owns the labels; belongs to the pool. Any thread
+// may call.
 class QueueLabels {
  public:
   // `statistics` must outlive this.
@@ -33,7 +33,7 @@ class QueueLabels {
 
   // The label with that text, made at the first call. Valid as long as this object.
   QueueLabel& label(std::string_view text) HALVOX_EXCLUDES(mutex_);
-  // The texts of the labels with a queue that is having a turn.
+  // Returns the texts of the labels that have a queue with a turn.
   [[nodiscard]] std::vector<std::string> atWork() HALVOX_EXCLUDES(mutex_);
 
  private:

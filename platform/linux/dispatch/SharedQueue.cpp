@@ -38,8 +38,8 @@ void SharedQueue::async(JobWeight /*weight*/, Job job) {
     label_.added.add();
     if (hasTurn_ || isWaiting_) return;
     hasTurn_ = true;
-    // Under the lock: a pool that is asked whether it is idle must count this job's turn from now
-    // on.
+    // Report the turn under the lock: a pool that is asked whether it is idle must count this job's
+    // turn from now on.
     pool_->beginTurn();
   }
   askForTurn();
@@ -57,14 +57,15 @@ void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
     if (isWaiting_) throw std::logic_error("a job called waitOn() a second time");
     isWaiting_ = true;
   }
-  // Without the lock: a signal that is kept ends the wait at once, and resume() takes the lock.
+  // Call this without the lock: a stored signal ends the wait at once, and resume() takes the lock.
   pool_->waits().begin(shared_from_this(), shared, timeout, std::move(then));
 }
 
 void SharedQueue::resume(Job then) {
   {
     const MutexLock lock(mutex_);
-    // In front: what follows the wait comes before the jobs that were added during it.
+    // Add it in front: the job that follows the wait comes before the jobs that were added during
+    // the wait.
     jobs_.push_front(std::move(then));
     label_.added.add();
     isWaiting_ = false;
@@ -95,11 +96,11 @@ void SharedQueue::runTurn() {
     if (pool_->isStopped()) return discardJobs();
     if (!runNext()) return;
   }
-  // Back to the end of the run queue, although jobs are left: other queues wait for this thread.
+  // Go back to the end of the run queue although jobs remain: other queues wait for this thread.
   beginTurn();
 }
 
-// False when there is nothing to run. The turn has then ended.
+// Returns false if there is nothing to run. The turn has then ended.
 bool SharedQueue::runNext() {
   Job job;
   {
@@ -113,7 +114,7 @@ bool SharedQueue::runNext() {
     jobs_.pop_front();
   }
   pool_->runner().run(job);
-  // After the job: a queue that is stuck in one has more jobs added than run.
+  // Count after the job: a queue that is stuck in a job then has more jobs added than run.
   label_.run.add();
   return true;
 }

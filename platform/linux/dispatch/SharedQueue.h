@@ -45,7 +45,7 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
 
   // Ends the wait: the queue continues with this job, then with those that were added meanwhile.
   void resume(Job then);
-  // Puts the turn that was asked for into the pool's run queue.
+  // Puts the requested turn into the pool's run queue.
   void beginTurn();
   // Discards and counts the jobs. Call after the pool has stopped.
   void discardJobs();

@@ -17,12 +17,13 @@ struct BucketBounds {
   friend bool operator==(const BucketBounds&, const BucketBounds&) = default;
 };
 
-// What does not change about a channel. Its address is the channel's identity: a source makes one
-// description for each of its channels, and uses the same one as long as the channel exists.
-// Comparing addresses makes a report cheap. Immutable; shared by the source and all readings.
+// The properties of a channel that never change. Its address is the channel's identity: a source
+// makes one description for each of its channels, and uses the same one as long as the channel
+// exists. Comparing addresses makes a report cheap. Immutable; shared by the source and all
+// readings.
 struct ChannelDescription {
   IOReportFormat format = IOReportFormat::kSimple;
-  // Of a simple channel. A gauge is the default: a fall of a gauge is never taken for a reset.
+  // For a simple channel. A gauge is the default: when a gauge falls, this never counts as a reset.
   IOReportKind kind = IOReportKind::kGauge;
   std::optional<std::string> driverName{};
   std::optional<std::string> group{};
@@ -40,8 +41,8 @@ struct ChannelDescription {
   friend bool operator==(const ChannelDescription&, const ChannelDescription&) = default;
 };
 
-// The channels of one source in order, and where the values of each begin in a reading. Immutable;
-// shared by readings, so that a reading costs no more than its numbers.
+// The channels of one source in order, and where the values of each begin in a reading. Immutable.
+// Readings share it: each reading then stores only its numbers.
 class ChannelList {
  public:
   using Channel = std::shared_ptr<const ChannelDescription>;

@@ -95,10 +95,11 @@ int show(const ChannelDescription& channel, Numbers values,
   return visitor(shown);
 }
 
-// The values of each channel. By address, which is a channel's identity.
+// The values of each channel, by its address, which is the channel's identity.
 using ValuesByChannel = std::unordered_map<const ChannelDescription*, Numbers>;
 
-// One look-up for each channel of the current samples, whatever the order of the previous ones.
+// With this index, each channel of the current samples needs one look-up, whatever the order of the
+// previous samples.
 ValuesByChannel index(const DriverSamples& samples) {
   ValuesByChannel values;
   for (const auto& [reading, selection] : samples.parts()) {
@@ -109,7 +110,7 @@ ValuesByChannel index(const DriverSamples& samples) {
   return values;
 }
 
-// Limited to what 64 bits hold: a difference that wrapped around would turn a fall into a rise.
+// Limit the difference to what 64 bits hold: one that wrapped around would turn a fall into a rise.
 std::uint64_t gaugeDifference(std::uint64_t previous, std::uint64_t current) {
   std::int64_t difference = 0;
   if (__builtin_sub_overflow(asSigned(current), asSigned(previous), &difference)) {
@@ -155,7 +156,8 @@ std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
     for (const std::uint32_t position : *selection) {
       const ChannelList::Channel& channel = (*now->channels)[position];
       const auto found = before.find(channel.get());
-      // What appeared after the first sample may have counted long before, so it is not reported.
+      // A channel that appeared after the first sample may have counted long before. Do not report
+      // it.
       if (found == before.end()) continue;
       appendDifference(*channel, found->second, valuesOf(*now, position), reading->values);
       channels.push_back(channel);

@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The channels of a reading that are meant, as positions in its list.
+// The selected channels of a reading, as positions in its list.
 using ChannelSelection = std::vector<std::uint32_t>;
 
 // The channels of one subscription at one moment, or their change between two moments. Immutable.
@@ -32,8 +32,8 @@ class DriverSamples final : public IOReportSamples {
 };
 
 // The change from one to the other, of the channels that are in both. A channel that is only in one
-// has no known start, and a source that was late has none either. The differences are those that
-// IOReportCreateSamplesDelta promises.
+// of them has no known start value. This includes the channels of a source that was late. The
+// differences are those that IOReportCreateSamplesDelta promises.
 [[nodiscard]] std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
                                                              const DriverSamples& current);
 

@@ -9,9 +9,9 @@ namespace halvox::platform::linux_ {
 
 // One place that driver counters come from.
 //
-// Its SourceReader owns it and calls it on one thread, which is the source's own: a source that
-// waits, for a disk or a driver, then delays no other source. A failure makes a reading smaller;
-// the source logs it.
+// Its SourceReader owns it and calls it on a thread that serves only this source: a source that
+// waits for a disk or a driver then delays no other source. A failure makes a reading smaller; the
+// source logs it.
 class DriverSource {
  public:
   DriverSource() = default;
@@ -21,14 +21,15 @@ class DriverSource {
 
   // Names the source in log lines and counters, such as "alsa".
   [[nodiscard]] virtual std::string_view name() const = 0;
-  // Prepares the source. May wait for a server to answer: the first reading decides what can be
-  // subscribed to. Called once, before any reading.
+  // Prepares the source. May wait for a server's answer, because the first reading decides which
+  // channels sessions can subscribe to. Called once, before any reading.
   virtual void open() {}
   // All channels that exist now, and their values. Never null; empty if there are none. What cannot
   // be read is skipped and logged by the source.
   [[nodiscard]] virtual std::shared_ptr<const Reading> read() = 0;
-  // The last reading was a sample of a session. Not called for readings that only find out which
-  // channels exist. Called after the reading was handed over: nobody waits for this call.
+  // Reports that the last reading was a sample of a session. Not called for readings that only find
+  // out which channels exist. Called after the reading was handed over, which means that no session
+  // waits for this call.
   virtual void sampled() {}
 };
 

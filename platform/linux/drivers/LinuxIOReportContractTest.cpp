@@ -1,4 +1,4 @@
-// The contract of driver counters, run on the adapter with a source that a test makes.
+// Tests the contract of driver counters on the adapter, with a source made by the test.
 
 #include <chrono>
 #include <memory>

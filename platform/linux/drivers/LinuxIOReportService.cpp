@@ -15,7 +15,7 @@ namespace {
 using Readers = std::vector<std::unique_ptr<SourceReader>>;
 using Readings = std::vector<std::shared_ptr<const Reading>>;  // by source; null: late
 
-// Asks all sources first and takes the readings afterwards, so that the wait is that of the slowest
+// Asks all sources first and takes the readings afterwards: the wait is then that of the slowest
 // source and not the sum.
 Readings read(const Readers& readers, std::chrono::milliseconds longestWait,
               SourceReader::Use use) {
@@ -42,7 +42,7 @@ struct GroupName {
 
 // The channels of a group that existed when the set was made, identified by their full names.
 // Immutable except for the positions in the sources' readings, which are computed again when the
-// channels of a source change. Shared by the samples' users; any thread may call.
+// channels of a source change. Shared by the samples' users; any thread may use it.
 class GroupChannels final : public IOReportChannels {
  public:
   GroupChannels(GroupName group, const Readings& readings)
@@ -63,8 +63,8 @@ class GroupChannels final : public IOReportChannels {
                                            std::shared_ptr<const Reading> reading) const {
     const MutexLock lock(mutex_);
     Found& found = found_[source];
-    // Sources keep their list while their channels stay the same. Most samples find the positions
-    // that the last one has computed.
+    // Sources keep their list while their channels stay the same. Most samples reuse the positions
+    // that the previous sample has computed.
     if (found.channels != reading->channels) {
       found = {reading->channels, find(*reading->channels)};
     }
@@ -81,7 +81,7 @@ class GroupChannels final : public IOReportChannels {
     auto selection = std::make_shared<ChannelSelection>();
     for (std::uint32_t position = 0; position < channels.size(); ++position) {
       const ChannelDescription& channel = *channels[position];
-      // The group first: comparing it allocates no text.
+      // Compare the group first, which allocates no text.
       if (group_.has(channel) && names_.contains(channel.fullName())) {
         selection->push_back(position);
       }
@@ -95,18 +95,17 @@ class GroupChannels final : public IOReportChannels {
   mutable std::vector<Found> found_ HALVOX_GUARDED_BY(mutex_);  // by source
 };
 
-// Nothing to keep: the set of channels says everything. The port asks for the object.
+// Empty, because the set of channels has all that is needed. The port requires the object.
 class GroupSubscription final : public IOReportSubscription {};
 
-// Reads the sources when it is asked for the first time, so that a moment without samples costs
-// nothing.
+// Reads the sources when the first sample is requested: a moment without samples costs nothing.
 class ReadMoment final : public IOReportMoment {
  public:
   ReadMoment(const Readers& readers, std::chrono::milliseconds longestWait)
       : readers_(readers), longestWait_(longestWait) {}
 
   [[nodiscard]] const Readings& readings() {
-    // Once for all groups. With a reading for each group, the median report took 0.98 ms.
+    // Read once for all groups. With a reading for each group, the median report took 0.98 ms.
     if (!readings_.has_value())
       readings_ = read(readers_, longestWait_, SourceReader::Use::kSample);
     return *readings_;
@@ -137,15 +136,16 @@ LinuxIOReportService::LinuxIOReportService(std::vector<std::unique_ptr<DriverSou
 LinuxIOReportService::~LinuxIOReportService() = default;
 
 void LinuxIOReportService::open() {
-  // All at once: the start of the service waits for the slowest source and not for the sum.
+  // Start all sources at once: the start of the service then waits for the slowest source and not
+  // for the sum.
   for (const auto& reader : readers_) reader->startOpening();
   for (const auto& reader : readers_) reader->waitUntilOpen();
 }
 
 IOReportService::Channels LinuxIOReportService::IOReportCopyChannelsInGroup(
     Name group, Name subGroup, std::optional<IOReportError>& /*error*/) {
-  // A channel that is missed here is missed until the service restarts, so this may take longer
-  // than the samples of a moment.
+  // A channel that is missed here is missing until the service restarts. This may therefore take
+  // longer than a sample.
   const Readings readings = read(readers_, std::max(longestWait_, SourceReader::kLongestOpening),
                                  SourceReader::Use::kFindChannels);
   GroupName names{std::optional<std::string>(group), std::optional<std::string>(subGroup)};
@@ -159,7 +159,7 @@ std::int32_t LinuxIOReportService::IOReportGetChannelCount(const Channels& chann
 IOReportService::Subscription LinuxIOReportService::IOReportCreateSubscription(
     const Channels& channels, Channels& subscribedChannels,
     std::optional<IOReportError>& /*error*/) {
-  // Nothing to allocate: a subscription is to the channels that its set has found.
+  // A subscription allocates nothing: it refers to the channels that its set has found.
   subscribedChannels = channels;
   return std::make_shared<GroupSubscription>();
 }
@@ -175,8 +175,8 @@ IOReportService::Samples LinuxIOReportService::IOReportCreateSamples(
   const Readings& readings = static_cast<ReadMoment&>(moment).readings();
   std::vector<DriverSamples::Part> parts;
   for (std::size_t source = 0; source < readings.size(); ++source) {
-    // A source that is late is missing from the samples. A difference then has no channel of it,
-    // where counting from zero would report everything since the driver was loaded.
+    // A source that is late is missing from the samples. A difference then has none of its
+    // channels. Counting from zero instead would report everything since the driver was loaded.
     if (readings[source] == nullptr) continue;
     DriverSamples::Part part = group.select(source, readings[source]);
     if (!part.selection->empty()) parts.push_back(std::move(part));

@@ -14,15 +14,15 @@ namespace halvox::platform::linux_ {
 
 // Reports what the kernel, the sound server and other daemons count as driver channels.
 //
-// A set of channels has those that exist when it is asked for, and a subscription never gets more.
-// A channel that disappears and appears again is sampled again; its names and its format identify
-// it. A source that takes longer than `SourceReader::kLongestOpening` to open is in no set that is
-// asked for before it has opened.
+// A set of channels has those that exist when the set is requested, and a subscription never gets
+// more. A channel that disappears and appears again is sampled again; its names and its format
+// identify it. If a source takes longer than `SourceReader::kLongestOpening` to open, the sets that
+// are requested before it has opened do not have its channels.
 //
-// Threads: any may call. A sample blocks for at most the longest wait, for all sources together; a
-// source that is late is skipped. Looking for channels, which the service does only when it starts,
-// may take as long as the opening.
-// Owner: the platform. It owns the sources and their threads, which sleep while nobody asks.
+// Threads: any thread may use it. A sample blocks for at most the longest wait, for all sources
+// together; a source that is late is skipped. Looking for channels, which the service does only
+// when it starts, may take as long as the opening. Owner: the platform. It owns the sources and
+// their threads, which sleep until a reading is requested.
 class LinuxIOReportService final : public IOReportService {
  public:
   // `log` and `statistics` must outlive the service.
@@ -41,7 +41,7 @@ class LinuxIOReportService final : public IOReportService {
   Subscription IOReportCreateSubscription(const Channels& channels, Channels& subscribedChannels,
                                           std::optional<IOReportError>& error) override;
   [[nodiscard]] Moment makeMoment() override;
-  // The moment must come from this service.
+  // The moment must have been made by this service.
   Samples IOReportCreateSamples(const Subscription& subscription, const Channels& channels,
                                 IOReportMoment& moment,
                                 std::optional<IOReportError>& error) override;

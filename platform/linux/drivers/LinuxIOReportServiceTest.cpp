@@ -69,7 +69,8 @@ class LinuxIOReportServiceTest : public ::testing::Test {
     return service_->IOReportCopyChannelsInGroup(group, subGroup, error);
   }
 
-  // Serves one channel and samples it once, which its source is too late for. The gate is closed.
+  // Serves one channel and samples it once. Its source is too late for the sample, and the gate
+  // stays closed.
   IOReportService::Channels serveLateSource() {
     serve([this] {
       gate_.pass();
@@ -197,7 +198,7 @@ TEST_F(LinuxIOReportServiceTest, AReadingThatWasBegunBeforeIsNotUsedAndTheNextOn
   std::jthread asker([&] { first = show(sample(found)); });
   readings.waitUntilBegun(before + 1);
 
-  // They ask during that reading and wait for the next one.
+  // They make their requests during that reading and wait for the next one.
   const auto asked = [this] {
     return platform_.statistics.values("driver source made").at("readings asked for");
   };
@@ -241,7 +242,7 @@ TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndItIsLoggedOnce
   longestWait_ = SourceReader::kLongestWait;
   const auto found = serveLateSource();
 
-  // Waiting again would make each of them slow, a busy machine only some.
+  // If they waited again, each of them would be slow. A busy machine makes only some of them slow.
   constexpr int kRounds = 20;
   int slowRounds = 0;
   for (int round = 0; round < kRounds; ++round) {
@@ -266,7 +267,7 @@ TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
   EXPECT_TRUE(eventually([&] { return show(sample(found)).size() == 1; }));
 }
 
-// Its counts begin when its driver was loaded, not when the session began.
+// Its counts start when its driver is loaded, not when the session starts.
 TEST_F(LinuxIOReportServiceTest, WhatASourceThatWasLateAtTheSnapshotCountedIsNotReported) {
   longestWait_ = kShortWait;
   const auto channel = simpleChannel("Tx", "a");
@@ -373,7 +374,7 @@ TEST_F(LinuxIOReportServiceTest, ManyThreadsMaySampleAtOnce) {
         values.push_back(channel.integerValue);
         return 0;
       });
-      // Both channels of a reading are from the same moment.
+      // Both channels of a reading have values of the same moment.
       if (values.size() == 2 && values[0] != values[1]) ++wrong;
     });
   }

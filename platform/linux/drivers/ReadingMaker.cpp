@@ -18,7 +18,8 @@ bool isListOf(const ChannelList& list, const std::vector<ChannelList::Channel>& 
 void ReadingMaker::add(const std::string& name, ChannelDescription description,
                        std::span<const std::uint64_t> values) {
   const auto found = known_.find(name);
-  // The same object as in the last reading, if nothing has changed: differences compare addresses.
+  // Use the same object as in the last reading if nothing has changed: differences compare
+  // addresses.
   Channel channel = found != known_.end() && *found->second == description
                         ? found->second
                         : std::make_shared<const ChannelDescription>(std::move(description));
@@ -32,12 +33,12 @@ void ReadingMaker::add(Channel channel, std::span<const std::uint64_t> values) {
 }
 
 std::shared_ptr<const Reading> ReadingMaker::finish(std::shared_ptr<void> lease) {
-  // Sharing the list lets a set of channels keep the positions that it has computed.
+  // Share the list: a set of channels can then keep the positions that it has computed.
   if (list_ == nullptr || !isListOf(*list_, channels_)) {
     list_ = std::make_shared<const ChannelList>(channels_);
   }
-  // A channel that was missing for one reading gets a new object, and is not compared with what it
-  // was before.
+  // A channel that was missing from one reading gets a new object, and is not compared with its
+  // earlier values.
   known_ = std::exchange(added_, {});
   channels_.clear();
   auto reading = std::make_shared<Reading>();

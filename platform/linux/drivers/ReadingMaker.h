@@ -10,8 +10,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Puts the readings of a source together and keeps the identity of its channels: if name and
-// description are the same as in the reading before, the channel is the same. While all channels
+// Makes the readings of a source and keeps the identity of its channels: if the name and the
+// description are the same as in the previous reading, the channel is the same. While all channels
 // are the same, readings share one list. A channel that is missing from a reading is forgotten.
 //
 // Belongs to the source's thread; the source owns it.
@@ -22,9 +22,10 @@ class ReadingMaker {
   // Adds a channel that the source identifies by this name.
   void add(const std::string& name, ChannelDescription description,
            std::span<const std::uint64_t> values);
-  // Adds a channel whose identity the source keeps itself.
+  // Adds a channel for which the source itself keeps the description.
   void add(Channel channel, std::span<const std::uint64_t> values);
-  // A reading of everything that was added since the last one. It holds the lease. Never null.
+  // Returns a reading of everything that was added since the last one. The reading holds the lease.
+  // Never null.
   [[nodiscard]] std::shared_ptr<const Reading> finish(std::shared_ptr<void> lease = nullptr);
 
  private:

@@ -12,7 +12,7 @@ std::string pieceOf(const DriverSource& source) {
 
 }  // namespace
 
-// The counters balance: asked for = given + skipped.
+// The counters balance: requested = given + skipped.
 SourceReader::SourceReader(std::unique_ptr<DriverSource> source, LogCategory& log,
                            StatisticsService& statistics, std::chrono::milliseconds longestWait)
     : source_(std::move(source)),
@@ -33,7 +33,8 @@ SourceReader::~SourceReader() {
 
 void SourceReader::startOpening() {
   thread_ = std::thread([this] { run(); });
-  // The first reading is asked for before the source is open: it is made as soon as that is.
+  // Request the first reading before the source is open: the reading is made as soon as it has
+  // opened.
   opening_ = ask(kLongestOpening, Use::kFindChannels);
 }
 
@@ -49,7 +50,7 @@ SourceReader::Asked SourceReader::ask(std::chrono::milliseconds wait, Use use) {
   if (use == Use::kSample) isSampleWanted_ = true;
   const std::uint64_t number = want();
   received_.add();
-  // A late source is read all the same, to find out whether it is in time again.
+  // Read a late source too, to find out whether it is in time again.
   if (isLate_) return {};
   ++waiting_;
   return {.number = number, .isWaiting = true, .wait = wait, .deadline = Clock::now() + wait};
@@ -78,7 +79,7 @@ SourceReader::ReadingPointer SourceReader::receive(const Asked& asked, bool& isF
 
 // Requests a reading that begins after this call. Returns its number.
 std::uint64_t SourceReader::want() {
-  // Not the reading that is being made: its values may be older than the request.
+  // Do not use the reading that is being made: its values may be older than the request.
   const std::uint64_t number = lastBegun_ + 1;
   if (lastWanted_ < number) {
     lastWanted_ = number;
@@ -87,19 +88,19 @@ std::uint64_t SourceReader::want() {
   return number;
 }
 
-// Null if it is late.
+// Returns null if the reading is late.
 SourceReader::ReadingPointer SourceReader::waitFor(std::uint64_t number,
                                                    Clock::time_point deadline) {
   bool inTime = true;
   while (lastMade_ < number && inTime) inTime = made_.waitUntil(mutex_, deadline);
   ReadingPointer reading = lastMade_ < number ? nullptr : handedOver_;
-  // Nobody else will take it, and a reading that is held keeps its source at work.
+  // No other thread will take the reading, and a reading that is held keeps its source at work.
   if (--waiting_ == 0) handedOver_.reset();
   return reading;
 }
 
 void SourceReader::run() {
-  // On this thread, so that all sources open at the same time.
+  // Open it on this thread: all sources then open at the same time.
   source_->open();
   const MutexLock lock(mutex_);
   makeReadings();
@@ -113,19 +114,20 @@ void SourceReader::makeReadings() {
     const bool isSample = std::exchange(isSampleWanted_, false);
     mutex_.unlock();
     const Clock::time_point start = Clock::now();
-    // Without the lock, so that others can ask for the next reading meanwhile.
+    // Read without the lock: other threads can then request the next reading meanwhile.
     ReadingPointer reading = source_->read();
     const Clock::duration time = Clock::now() - start;
     mutex_.lock();
-    // By the time that the reading took, and not by whether somebody waited for it: nobody waits
-    // for a late source.
+    // Decide by the time that the reading took, and not by whether a waiting thread received it: no
+    // thread waits for a late source.
     if (time <= longestWait_) isLate_ = false;
     lastMade_ = lastBegun_;
-    // Also for threads that wait for the next reading: it will replace this one.
+    // Hand it over also to threads that wait for the next reading, which will replace this one.
     if (waiting_ > 0) std::swap(handedOver_, reading);
     made_.notifyAll();
     mutex_.unlock();
-    // Releasing a reading may call the source, which must not delay threads that ask.
+    // Release it without the lock: that may call the source, which must not delay threads with
+    // requests.
     reading.reset();
     if (isSample) source_->sampled();
     mutex_.lock();

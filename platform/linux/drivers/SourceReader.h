@@ -12,25 +12,27 @@
 
 namespace halvox::platform::linux_ {
 
-// Reads one source on a thread of its own, so that a slow source holds up a session's start or stop
-// for a bounded time only.
+// Reads one source on a thread of its own, which bounds how long a slow source can delay the start
+// or stop of a session.
 //
 //   made --startOpening()--> opening --> in time <--> late
 //
-// It is late after a reading that took too long, and in time after one that did not.
+// The source is late after a reading that took too long, and in time again after one that did not.
 //
-// Nobody receives a reading that began before the request: it would miss what was counted in
-// between. Requests that come during a reading share the next one.
+// A request never gets a reading that began before it: such a reading would miss what was counted
+// in between. Requests that arrive during a reading share the next one.
 //
-// Any thread may ask. The service owns it; it owns the source. Its destructor waits for the reading
-// that is in progress.
+// Any thread may use it. The service owns it; it owns the source. Its destructor waits for the
+// reading that is in progress.
 class SourceReader {
  public:
   using Clock = std::chrono::steady_clock;
 
-  // Both ends of a session wait for it on the reporting queue, and with them all other clients.
+  // The start and the stop of a session wait this long on the reporting queue, and all other
+  // clients wait with them.
   static constexpr std::chrono::milliseconds kLongestWait{50};
-  // Once, when the service starts. What is missed then is missing until the next start.
+  // Applies once, when the service starts. A channel that is missed then is missing until the next
+  // start.
   static constexpr std::chrono::milliseconds kLongestOpening{1000};
 
   // `log` and `statistics` must outlive the reader. `longestWait` is the time that a reading may
@@ -41,9 +43,9 @@ class SourceReader {
   SourceReader& operator=(const SourceReader&) = delete;
   ~SourceReader();
 
-  // The first call begins to open the source. The second waits until it has opened; if it takes too
-  // long, that is logged and the source counts as late. Call each once, in this order, before
-  // everything else.
+  // The first one begins to open the source. The second one waits until it has opened. If that
+  // takes too long, it logs this, and the source counts as late. Call each once, in this order,
+  // before everything else.
   void startOpening();
   void waitUntilOpen();
   // A request for a reading. The thread that asked passes it to take(), once.
@@ -55,12 +57,12 @@ class SourceReader {
   };
   // What a reading is for: which channels there are, or a sample of a session.
   enum class Use : std::uint8_t { kFindChannels, kSample };
-  // Asks for a reading, which may take that long. Does not block, so several sources can read at
-  // the same time.
+  // Requests a reading, which may take `wait`. Does not block: several sources can read at the same
+  // time.
   [[nodiscard]] Asked ask(std::chrono::milliseconds wait, Use use);
-  // Waits for the reading that was asked for; null if it does not come in time. The first time in a
-  // row is logged. After that the source is still read, but nobody waits for it until a reading has
-  // been in time again.
+  // Waits for the requested reading. Returns null if it does not arrive in time, and logs the first
+  // time in a row. After that the source is still read, but no thread waits for it until a reading
+  // has been in time again.
   [[nodiscard]] std::shared_ptr<const Reading> take(const Asked& asked);
 
  private:
@@ -86,8 +88,7 @@ class SourceReader {
   Condition made_;
   bool isEnding_ HALVOX_GUARDED_BY(mutex_) = false;
   bool isLate_ HALVOX_GUARDED_BY(mutex_) = false;  // logged, and not in time again yet
-  // Numbers of readings, from 1: of the latest that was asked for, that has begun, and that is
-  // finished.
+  // The numbers, counted from 1, of the latest readings that were requested, begun and finished.
   std::uint64_t lastWanted_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t lastBegun_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t lastMade_ HALVOX_GUARDED_BY(mutex_) = 0;

@@ -1,4 +1,4 @@
-// The contract of files, kept by the adapter.
+// Tests the contract of files on the adapter.
 
 #include "platform/fake/contracts/FileContract.h"
 
@@ -19,7 +19,7 @@ class RootedFileHarness {
   FileService& service() { return service_; }
   std::vector<std::string> names(const std::string& directory) const {
     std::vector<std::string> names;
-    std::error_code none;  // such as a directory that was not made
+    std::error_code none;  // a missing directory has no names
     for (const auto& entry : std::filesystem::directory_iterator(pathOf(directory), none)) {
       names.push_back(entry.path().filename().string());
     }

@@ -12,10 +12,10 @@
 namespace halvox::platform::linux_ {
 
 // An open directory below a root. The path is opened one name at a time, without following a
-// symbolic link below the root, and ".." is refused. Nobody who may write below the root can
-// therefore redirect the service to a place outside it. The root itself may be a link.
+// symbolic link below the root, and ".." is refused. A program that may write below the root
+// therefore cannot redirect the service to a place outside it. The root itself may be a link.
 //
-// Any thread may call. Blocks on the disk.
+// Any thread may use it. Blocks on the disk.
 struct RootedDirectory {
   // A path that is absolute to the callers and lies below `root` in the file system.
   struct Place {

@@ -1,4 +1,4 @@
-// What happens when the system refuses a file or a directory, and what a killed service leaves.
+// Tests what happens if the system refuses a file or a directory, and what a killed service leaves.
 
 #include <cerrno>
 #include <filesystem>

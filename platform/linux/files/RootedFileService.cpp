@@ -46,7 +46,7 @@ class RootedJsonArrayFile final : public JsonArrayFile {
 
   std::optional<Error> commit(std::string& path) override {
     if (!isCommitted_ && !error_.has_value()) finish();
-    // Counted once, however often the caller asks again.
+    // Count it only once, even if the caller tries again.
     if (!isCommitted_) (error_.has_value() ? counters_.failed : counters_.written).add();
     isCommitted_ = true;
     if (!error_.has_value()) path = path_;
@@ -64,7 +64,7 @@ class RootedJsonArrayFile final : public JsonArrayFile {
     }
   }
 
-  // Collects text, so that a write has at least kBufferBytes: an object alone is much shorter.
+  // Collect text until a write has at least kBufferBytes: a single object is much shorter.
   void takeText() {
     buffer_ += json_.takeText();
     if (buffer_.size() >= kBufferBytes) flush();

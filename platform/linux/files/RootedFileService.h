@@ -10,10 +10,10 @@ namespace halvox::platform::linux_ {
 // Creates directories and files below a root directory. Follows no symbolic link below the root, so
 // nothing is written outside it. A file gets its name only when its content is on the disk.
 //
-// Any thread may call; a file belongs to one thread. Blocks on the disk. Every failure is an Error
-// with the path and the system's text. Invalid file names are errors: those that are empty, ".",
-// "..", too long, or contain a slash or NUL. Counts the files that were begun, written, failed and
-// abandoned.
+// Any thread may use the service; a file belongs to one thread. Blocks on the disk. Every failure
+// is an Error with the path and the system's text. Invalid file names are errors: those that are
+// empty, ".", "..", too long, or contain a slash or NUL. Counts the files that were begun, written,
+// failed and abandoned.
 class RootedFileService final : public FileService {
  public:
   // Does not own `statistics`, which must outlive the service. The service must outlive its files.

@@ -64,7 +64,7 @@ int UnfinishedFile::beginNamed() {
     ownName_.clear();
     return errno;
   }
-  // Until the file is locked, its age keeps other processes from removing it.
+  // Until the file is locked, other processes do not remove it because it is new.
   return ::flock(file_.get(), LOCK_EX | LOCK_NB) == 0 ? 0 : errno;
 }
 
@@ -79,14 +79,15 @@ int UnfinishedFile::write(std::string_view bytes) {
 }
 
 int UnfinishedFile::finish(const std::string& name) {
-  // Before the name: after a power cut, a file with a name must have its content.
+  // Sync before the file gets its name: after a power cut, a file with a name must have its
+  // content.
   if (::fsync(file_.get()) != 0) return errno;
   if (const int error = giveName(name)) return error;
   ownName_.clear();
   // The name is not on the disk before the directory is. A file system that cannot sync a directory
-  // answers EINVAL; the file is finished all the same.
+  // returns EINVAL; the file is finished nevertheless.
   if (::fsync(directory_.get()) != 0 && errno != EINVAL) return errno;
-  // Here, where the directory is being written anyway.
+  // Do this here, because the directory is being written anyway.
   removeLeftOvers();
   discard();
   return 0;

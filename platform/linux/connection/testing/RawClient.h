@@ -20,7 +20,7 @@ struct RawAnswer {
   dbus::MessageType type = dbus::MessageType::kMethodReturn;
   std::uint32_t replySerial = 0;
   std::string errorName;
-  std::vector<Value> values;  // of the signature that the message has
+  std::vector<Value> values;  // of the types in the message's signature
 };
 
 // A client that sends any bytes, to test what proper clients never do. Reads wait for kTestDeadline

@@ -73,7 +73,7 @@ class FieldReader {
   FieldReader(std::span<const std::byte> fields, bool bigEndian, MessageHeader& header)
       : reader_(fields, bigEndian), header_(header) {}
 
-  // False on an error. error() then describes it.
+  // Returns false on an error. error() then describes it.
   bool readAll() {
     while (!reader_.atLimit()) {
       if (!readField()) return false;

@@ -35,8 +35,8 @@ inline constexpr unsigned kMaxRefusedLines = 16;
 // Collects the lines of a handshake from input that arrives in pieces of any size.
 class HandshakeLine {
  public:
-  // Takes bytes up to the end of the line, and removes them from `input`. True when the line is
-  // complete.
+  // Takes bytes up to the end of the line, and removes them from `input`. Returns true if the line
+  // is complete.
   bool take(std::span<const std::byte>& input);
   // The line without its end; valid until the next take().
   [[nodiscard]] std::string_view text() const;

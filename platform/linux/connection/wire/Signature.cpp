@@ -31,7 +31,7 @@ class TypeScanner {
 
   [[nodiscard]] bool atEnd() const { return position_ == text_.size(); }
 
-  // False when no complete type starts here.
+  // Returns false if no complete type starts here.
   bool scanType(unsigned arrays, unsigned structs) {
     const char code = next();
     const Role role = roleOf(code);

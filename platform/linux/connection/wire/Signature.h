@@ -24,7 +24,7 @@ enum class SignatureShape : std::uint8_t {
 // The shape of exactly one complete type, which is what a variant has.
 [[nodiscard]] SignatureShape shapeOfType(std::string_view type);
 
-// True for a valid signature, whether or not its types are supported.
+// Returns true for a valid signature, whether or not its types are supported.
 [[nodiscard]] bool isSignature(std::string_view signature);
 
 // The length of the first complete type. The signature must be valid and not empty.

@@ -19,9 +19,9 @@ class ValueEncoder {
  public:
   ValueEncoder(std::string& out, std::size_t start) : out_(out), start_(start) {}
 
-  // Appends one value for each type of a signature. False if a value does not fit its type, or if
-  // the numbers of values and types differ; what was appended until then stays in the buffer.
-  // FrameWriter.h has the rules.
+  // Appends one value for each type of a signature. Returns false if a value does not fit its type,
+  // or if the numbers of values and types differ. What was appended before the failure stays in the
+  // buffer. FrameWriter.h has the rules.
   [[nodiscard]] bool appendAll(std::string_view signature, std::span<const Value> values);
 
   void align(std::size_t alignment);

@@ -6,8 +6,8 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// Skips one value of any valid type, and checks it by the rules of the wire. False if it breaks a
-// rule, including the limit of kMaxNesting levels; the reader then has the problem.
+// Skips one value of any valid type, and checks it by the rules of the wire. Returns false if it
+// breaks a rule, including the limit of kMaxNesting levels. The problem is then in the reader.
 [[nodiscard]] bool skipValue(WireReader& reader, std::string_view type);
 
 }  // namespace halvox::platform::linux_::dbus

@@ -37,7 +37,8 @@ std::vector<std::string> namesIn(int directory) {
     if (found->d_name[0] != '.') names.emplace_back(found->d_name);
     if (names.size() == kMostEntries) break;
   }
-  // A directory has no order of its own, and later cards and devices of one name get a number.
+  // A directory has no fixed order. The order matters, because later cards and devices of the same
+  // name get a number.
   std::ranges::sort(names);
   return names;
 }
@@ -73,7 +74,8 @@ std::shared_ptr<const Reading> AlsaSource::read() {
                {nameFor(folder, name == names.end() ? folder : name->second, *number)});
     }
   }
-  // What was not seen in this round has disappeared. A card that returns counts from zero.
+  // Entries that were not seen in this round have disappeared. A card that returns counts from
+  // zero.
   const auto isGone = [this](const auto& item) { return item.second.round != round_; };
   std::erase_if(substreams_, isGone);
   std::erase_if(powers_, isGone);
@@ -178,7 +180,8 @@ void AlsaSource::readPower(const std::string& folder, const Card& card) {
   const bool isSuspended =
       cleanText(textOf(directory.get(), "runtime_status").value_or("")) == "suspended";
 
-  // The kernel counts the times but not the transitions, so these are what two readings show.
+  // The kernel counts the times but not the transitions, which are therefore derived from two
+  // readings.
   const bool isNew = !powers_.contains(folder);
   Power& power = powers_[folder];
   power.round = round_;

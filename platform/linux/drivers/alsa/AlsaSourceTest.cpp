@@ -21,7 +21,7 @@ using testing::samplesOf;
 using ::testing::SizeIs;
 using ::testing::StartsWith;
 
-// Works on a copy of a recorded tree, with a clock that it sets.
+// A fixture with a copy of a recorded tree and a clock that the test sets.
 class AlsaSourceTest : public ::testing::Test {
  protected:
   void use(const char* tree) {

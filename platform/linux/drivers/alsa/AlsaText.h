@@ -9,7 +9,8 @@
 
 namespace halvox::platform::linux_ {
 
-// The states of a PCM substream, in the kernel's words; that of a closed one comes first.
+// The states of a PCM substream, in the kernel's words. The state of a closed substream comes
+// first.
 inline constexpr std::array<std::string_view, 10> kPcmStates{
     "CLOSED", "OPEN",     "SETUP",  "PREPARED",  "RUNNING",
     "XRUN",   "DRAINING", "PAUSED", "SUSPENDED", "DISCONNECTED"};
@@ -22,16 +23,18 @@ struct PcmStatus {
   std::uint64_t applicationFrames = 0;  // appl_ptr
 };
 
-// None if the text is not what the kernel writes.
+// Returns std::nullopt if the text is not what the kernel writes.
 [[nodiscard]] std::optional<PcmStatus> parsePcmStatus(std::string_view text);
 
-// The name of a PCM from its info file, or its ID if it has no name. None if it has neither.
+// Returns the name of a PCM from its info file, or its ID if it has no name. Returns std::nullopt
+// if it has neither.
 [[nodiscard]] std::optional<std::string> parsePcmName(std::string_view text);
 
 // The names of the cards in /proc/asound/cards, by card number.
 [[nodiscard]] std::map<unsigned, std::string> parseCards(std::string_view text);
 
-// A number that is alone on its line, as in files of sysfs. None for anything else.
+// Returns a number that is alone on its line, as in files of sysfs. Returns std::nullopt for any
+// other text.
 [[nodiscard]] std::optional<std::uint64_t> parseSysfsNumber(std::string_view text);
 
 // The text without white space at its ends; bytes that are not UTF-8 become U+FFFD.

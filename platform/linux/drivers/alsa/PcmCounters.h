@@ -12,9 +12,9 @@ namespace halvox::platform::linux_ {
 // Counts one PCM substream across its streams: the kernel's pointers restart with each stream, and
 // the counts here continue.
 //
-// The kernel keeps no history. A state is taken to hold from the look that found it to the look
-// that finds another; what happens between two looks and leaves no trace is not counted. Belongs to
-// the source's thread.
+// The kernel keeps no history. A state counts from the reading that found it to the reading that
+// finds another one. What happens between two readings and leaves no trace is not counted. Belongs
+// to the source's thread.
 class PcmCounters {
  public:
   using Clock = std::chrono::steady_clock;
@@ -24,7 +24,7 @@ class PcmCounters {
     std::chrono::microseconds residency{};
   };
 
-  // Takes the status at a time. Times must not go back.
+  // Adds the status at a time. Times must not go back.
   void look(const PcmStatus& status, Clock::time_point now);
 
   [[nodiscard]] std::uint64_t hardwareFrames() const { return hardware_.total; }

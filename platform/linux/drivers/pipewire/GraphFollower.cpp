@@ -21,8 +21,8 @@ namespace {
 // second.
 constexpr int kRoundTrips = 2;
 
-// A socket appears before it accepts connections, and a server that ends may still accept some. A
-// few attempts are therefore made after a socket has appeared or a connection has ended.
+// A socket appears before it accepts connections, and a server that ends may still accept some.
+// Therefore make a few attempts after a socket has appeared or a connection has ended.
 constexpr int kAttempts = 5;
 constexpr auto kPauseBetweenAttempts = std::chrono::milliseconds(200);
 
@@ -47,7 +47,7 @@ std::optional<NodeState> nodeState(pw_node_state state) {
   return std::nullopt;
 }
 
-// Only what is needed: no user configuration, no real-time scheduling, no bus.
+// Load only what is needed: no user configuration, no real-time scheduling, no bus.
 pipewire::UniqueContext makeContext(pw_loop* loop, const ObjectLog& log) {
   // The library warns about the missing parts. They are missing on purpose.
   if (std::getenv("PIPEWIRE_DEBUG") == nullptr) pw_log_set_level(SPA_LOG_LEVEL_ERROR);
@@ -126,10 +126,11 @@ bool GraphFollower::isLeased() {
 }
 
 void GraphFollower::proceed() {
-  // A timer that is still set would cause a second attempt.
+  // Disable the timer: it would cause a second attempt.
   proceedAfter(std::nullopt);
   const bool isWanted = isLeased();
-  // First: until it is disconnected, everything below would use the connection that has ended.
+  // Do this first: until it is disconnected, everything below would use the connection that has
+  // ended.
   if (std::exchange(isLost_, false)) {
     disconnect();
     if (isWanted) {
@@ -138,15 +139,17 @@ void GraphFollower::proceed() {
     }
     return;
   }
-  // Once although no session wants it: channels are found at the start, when no session runs yet.
+  // Try once even if no session needs the server: the service looks for channels at its start, when
+  // no session runs yet.
   if (!server_.isConnected() && (isWanted || !isTried_)) lookForServer();
-  // Nothing wakes this thread while no session runs or the server is connected.
+  // Stop watching: nothing may wake this thread while no session runs or while the server is
+  // connected.
   if (server_.isConnected() || !isWanted) watch_.end();
   updateProfiler(isWanted);
 }
 
 void GraphFollower::lookForServer() {
-  // Before the attempt: a socket that appears after it must be noticed.
+  // Watch before the attempt: a socket that appears after the attempt must be noticed.
   watch_.begin();
   if (attempts_ == 0) return;
   --attempts_;
@@ -172,7 +175,7 @@ void GraphFollower::disconnect() {
   if (!server_.isConnected()) return;
   updateProfiler(false);
   profilerID_.reset();
-  // Bindings before the connection, which they use to release the server's objects.
+  // Destroy the bindings before the connection, which they use to release the server's objects.
   nodes_.clear();
   server_.disconnect();
   settle();
@@ -205,7 +208,8 @@ void GraphFollower::updateProfiler(bool isWanted) {
   if (isWanted && isPossible && profiler_ == nullptr) {
     {
       const MutexLock lock(graph_.mutex);
-      // Before the binding: what the driver counted until now must not be taken for this session's.
+      // Do this before binding: what the driver has counted until now must not count for this
+      // session.
       graph_.statistics.profilingBegan();
     }
     profiler_ = std::make_unique<pipewire::ProfilerBinding>(
@@ -218,7 +222,7 @@ void GraphFollower::updateProfiler(bool isWanted) {
 }
 
 void GraphFollower::onProfile(const spa_pod* profile) {
-  // Decoded before the lock, for which readings may wait.
+  // Decode before taking the lock, for which readings may wait.
   const auto cycles = pipewire::decodeProfile(profile);
   const MutexLock lock(graph_.mutex);
   for (const pipewire::ProfiledCycle& cycle : cycles) graph_.statistics.cycleEnded(cycle);
@@ -239,7 +243,7 @@ void GraphFollower::onServerReached(const pw_core_info& server) {
 void GraphFollower::onServerLost() {
   isLost_ = true;
   log_.notice("the connection to PipeWire ended; waiting for the server while sessions run");
-  // Lets the timer disconnect: the library does not allow that inside this call.
+  // Disconnect from the timer: the library does not allow that inside this call.
   proceedAfter(Clock::duration::zero());
 }
 

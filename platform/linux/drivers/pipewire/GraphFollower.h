@@ -23,15 +23,15 @@ namespace halvox::platform::linux_ {
 //
 // Threads: everything runs on the loop's thread, except construction and destruction, which happen
 // while that thread does not run. PipeWireDriverSource owns it; it borrows the loop and the graph.
-// Failure: a server that is missing or disconnects is not an error. PipeWireDriverSource says when
-// it is looked for.
+// Failure: a server that is missing or disconnects is not an error. The comment of
+// PipeWireDriverSource says when a server is searched for.
 class GraphFollower final : private pipewire::ServerListener {
  public:
   // All three must outlive it.
   GraphFollower(pw_loop* loop, SharedGraph& graph, LogCategory& log);
   ~GraphFollower() override;
 
-  // False if the library cannot be used at all, which is logged.
+  // Returns false and logs an error if the library cannot be used at all.
   [[nodiscard]] bool isUsable() const { return context_ != nullptr; }
   // Connects to the server or waits for it, and binds or releases the profiler, depending on the
   // graph's lease. Must not be called from a callback of the server's objects, because it may
@@ -44,13 +44,13 @@ class GraphFollower final : private pipewire::ServerListener {
   class Node;
 
   [[nodiscard]] bool isLeased();
-  // The work of update() without another attempt to connect.
+  // Does the work of update(), but allows no additional attempt to connect.
   void proceed();
   void lookForServer();
   void connect();
   void disconnect();
   void settle();
-  // Runs proceed() after that time; none cancels it.
+  // Runs proceed() after `pause`. std::nullopt cancels the run.
   void proceedAfter(std::optional<Clock::duration> pause);
   void serverAppeared();
   void updateProfiler(bool isWanted);

@@ -43,7 +43,8 @@ GraphStatistics::GraphStatistics()
           makeChannel(describeNodeChannel(kSourceGroup, "pipewire", "connections"))} {}
 
 void GraphStatistics::serverLost(Time now) {
-  // Kept: the counts are this process's own, and continue when the server has restarted.
+  // Keep the statistics: this process has made the counts itself, and continues them after the
+  // server has restarted.
   for (auto& [id, node] : nodes_) keep(std::move(node), now);
   nodes_.clear();
   drivers_.clear();
@@ -73,7 +74,8 @@ void GraphStatistics::keep(std::unique_ptr<NodeStatistics> node, Time now) {
   gone_.push_back(std::move(node));
 }
 
-// The statistics of the node of that name that has disappeared; new ones if there is none.
+// Returns the statistics of the node of that name that has disappeared, or new ones if there is
+// none.
 std::unique_ptr<NodeStatistics> GraphStatistics::statisticsOf(std::string_view group,
                                                               const std::string& name) {
   const auto found = std::ranges::find_if(gone_, [&](const auto& node) {

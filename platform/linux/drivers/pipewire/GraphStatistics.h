@@ -20,11 +20,11 @@ namespace halvox::platform::linux_ {
 //
 // Nodes are identified by the server's IDs; an ID that is used again is another node. When a node
 // disappears, its channels do too. When a node of the same class and name appears, on this server
-// or the next, it gets the same channels and their counts continue, so a session does not lose what
-// was counted before. This is only possible because the counts are made here and contain nothing
-// else.
+// or the next, it gets the same channels and their counts continue. A session therefore does not
+// lose what was counted before. This is only possible because the counts are made here and not by
+// the server.
 //
-// It uses neither PipeWire nor a clock, so that tests need neither: the caller passes events and
+// It uses neither PipeWire nor a clock, and its tests need neither: the caller passes events and
 // times. Not thread-safe; SharedGraph owns and guards it. Cannot fail.
 class GraphStatistics {
  public:
@@ -43,9 +43,9 @@ class GraphStatistics {
   // The profiler begins to report cycles. Those before this call were not reported.
   void profilingBegan();
 
-  // Returns false if the node is neither sink nor source, or if there are kMostNodes already. Its
-  // further events are not needed then. If the key of a report would be equal for two nodes, the
-  // later one is called "name#id".
+  // Returns false if the node is neither sink nor source, or if there are kMostNodes already. The
+  // caller then need not pass its later events. If the key of a report would be equal for two
+  // nodes, the later one is called "name#id".
   bool nodeAdded(NodeID id, std::string_view mediaClass, std::string_view name);
   void nodeRemoved(NodeID id, Time now);
   void nodeStateChanged(NodeID id, std::optional<NodeState> state, Time now);
@@ -69,7 +69,8 @@ class GraphStatistics {
   std::array<ChannelList::Channel, 2> connectionsChannels_;
   std::uint64_t connections_ = 0;
   std::map<NodeID, std::unique_ptr<NodeStatistics>> nodes_;
-  // Of nodes that have disappeared, the newest last; at most kMostNodes, the oldest is forgotten.
+  // The statistics of nodes that have disappeared, the latest last. At most kMostNodes; the oldest
+  // is removed.
   std::deque<std::unique_ptr<NodeStatistics>> gone_;
   std::map<NodeID, Driver> drivers_;  // including nodes that are neither sink nor source
 };

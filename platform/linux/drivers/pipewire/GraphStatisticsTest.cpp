@@ -24,7 +24,7 @@ using ::testing::StartsWith;
 
 class GraphStatisticsTest : public ::testing::Test {
  protected:
-  // The channels as lines, only those that begin with this text.
+  // Returns those channels as lines that begin with this text.
   std::vector<std::string> read(std::string_view start = "") {
     graph.addTo(maker, now);
     std::vector<std::string> lines = describe(testing::samplesOf(maker.finish()));
@@ -158,8 +158,8 @@ TEST_F(GraphStatisticsTest, TheSecondNodeOfANameHasItsNumberAppended) {
   EXPECT_THAT(read("twin/Rx"), Contains("twin/Rx/PipeWire/cycles  = 0"));
 }
 
-// The keys of a report contain no blanks and no underscores, and nothing of a driver's name from
-// its first "<" on.
+// The keys of a report contain no blanks and no underscores, and only the part of a driver's name
+// before its first "<".
 TEST_F(GraphStatisticsTest, NamesThatAReportCannotDistinguishHaveTheirNumbersToo) {
   graph.nodeAdded(30, "Audio/Sink", "usb_out");
   graph.nodeAdded(31, "Audio/Sink", "usb out");

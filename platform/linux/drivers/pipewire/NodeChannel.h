@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The groups of the channels of sinks and sources, and the subgroup of both.
+// The groups of the channels of sinks and of sources, and the subgroup that both have.
 inline constexpr const char* kSinkGroup = "Speaker";
 inline constexpr const char* kSourceGroup = "Rx";
 inline constexpr const char* kPipeWireSubGroup = "PipeWire";

@@ -33,8 +33,8 @@ class DurationHistogram {
 
 enum class NodeState : std::uint8_t { kRunning, kIdle, kSuspended };
 
-// Counts how often and how long a node was in each state. A plain value. Times come from one clock
-// that does not go back.
+// Counts how often and how long a node was in each state. A plain value. All times must come from
+// one clock that does not go back.
 class StateResidency {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -42,8 +42,8 @@ class StateResidency {
 
   [[nodiscard]] static std::vector<std::string> names();
 
-  // None means a state that is not counted. Setting the current state again is not a transition,
-  // and neither is the first known state.
+  // std::nullopt stands for a state that is not counted. Setting the current state again is not a
+  // transition, and neither is the first known state.
   void change(std::optional<NodeState> state, Time now);
   // The node has disappeared. The first state after its return is not a transition.
   void leave(Time now);

@@ -34,7 +34,7 @@ class Bell {
   spa_source* event_ HALVOX_GUARDED_BY(mutex_) = nullptr;
 };
 
-// Held by readings. Rings when the last of them is destroyed, so that the profiler is released.
+// Held by readings. Rings when the last of them is destroyed, and the profiler is then released.
 class Lease {
  public:
   explicit Lease(std::shared_ptr<Bell> bell) : bell_(std::move(bell)) {}
@@ -55,10 +55,11 @@ class PipeWireDriverSource::Impl {
     pw_init(nullptr, nullptr);
   }
   ~Impl() {
-    // First: leases may outlive this and must not ring a loop that ends.
+    // Do this first: leases may outlive this object and must not ring a loop that ends.
     bell_->remove();
     if (loop_ != nullptr) pw_thread_loop_stop(loop_);
-    // After the thread has stopped, because the connection's objects belong to it.
+    // Destroy it after the thread has stopped, because the connection's objects belong to the
+    // thread.
     connection_.reset();
     if (event_ != nullptr) pw_loop_destroy_source(pw_thread_loop_get_loop(loop_), event_);
     if (loop_ != nullptr) pw_thread_loop_destroy(loop_);
@@ -86,7 +87,7 @@ class PipeWireDriverSource::Impl {
     std::shared_ptr<void> lease;
     {
       const MutexLock lock(graph_.mutex);
-      // One lease for all sessions: the profiler is bound while any of them is held.
+      // All readings share one lease: the profiler is bound while any reading is held.
       lease = graph_.lease.lock();
       if (lease == nullptr) {
         lease = std::make_shared<Lease>(bell_);
@@ -95,7 +96,8 @@ class PipeWireDriverSource::Impl {
       }
       graph_.statistics.addTo(maker_, std::chrono::steady_clock::now());
     }
-    // Only the first lease has something to change. Ringing wakes the loop's thread.
+    // Ring only for the first lease, because others change nothing. Ringing wakes the loop's
+    // thread.
     if (isNew) bell_->ring();
     return maker_.finish(std::move(lease));
   }
@@ -115,7 +117,7 @@ class PipeWireDriverSource::Impl {
     if (!connection_->isUsable()) return false;
     event_ = pw_loop_add_event(loop, &Impl::onRing, this);
     if (event_ == nullptr || pw_thread_loop_start(loop_) != 0) return false;
-    // Last: only a loop that runs can be woken.
+    // Set this last: only a loop that runs can be woken.
     bell_->install(loop, event_);
     return true;
   }

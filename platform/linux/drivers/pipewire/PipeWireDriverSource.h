@@ -12,14 +12,13 @@ namespace halvox::platform::linux_ {
 // cycles, xruns, the times of each cycle, and the states of the nodes.
 //
 // Threads: the library has a thread that follows the server. It sleeps until the server sends an
-// event. While nobody holds a reading, events come only when nodes appear, disappear or change
-// their state. The profiler, which reports each cycle, is bound only while someone holds a reading:
-// an idle service must not wake up for every cycle. Only cycles of such times are counted. The
-// first reading begins such a time.
-// Owner: its SourceReader, which calls it on one thread.
-// Failure: without a server there are only the channels "connections", which count how often the
-// server was reached. It is looked for when the first reading is held, and it is connected to as
-// soon as its socket appears while a reading is held. Nothing wakes up meanwhile.
+// event. While no reading is held, events come only when nodes appear, disappear or change their
+// state. The profiler, which reports each cycle, is bound only while a reading is held: an idle
+// service must not wake up for every cycle. Cycles are therefore counted only from the first held
+// reading on, while any is held. Owner: its SourceReader, which calls it on one thread. Failure:
+// without a server there are only the channels "connections", which count how often the server was
+// reached. The source looks for the server when the first reading is held, and connects as soon as
+// its socket appears while a reading is held. Nothing wakes up meanwhile.
 class PipeWireDriverSource final : public DriverSource {
  public:
   struct Options {

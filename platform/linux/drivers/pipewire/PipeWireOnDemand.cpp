@@ -13,7 +13,7 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::array<std::uint64_t, 1> kNone{0};
-// What a server that is there may take to name its objects. More would make the source late.
+// How long a running server may take to name its objects. A longer time would make the source late.
 constexpr std::chrono::milliseconds kLongestOpening{800};
 
 bool isModuleThere() {
@@ -23,8 +23,9 @@ bool isModuleThere() {
 
 }  // namespace
 
-// Held by readings that were made before the module was loaded. A session that holds one of them
-// then holds a reading of the loaded source too, which follows the server as long as one is held.
+// Held by readings that were made before the module was loaded. When the module is loaded, a
+// session that holds such a reading must also hold one of the loaded source, which follows the
+// server only while a reading is held.
 struct PipeWireOnDemand::Lease {
   std::shared_ptr<const Reading> ofLoaded;
 };
@@ -36,9 +37,9 @@ PipeWireOnDemand::PipeWireOnDemand(LogCategory& log)
                    makeChannel(describeNodeChannel(kSourceGroup, "pipewire", "connections"))} {}
 
 void PipeWireOnDemand::open() {
-  // A module that is missing is reported at the start, and not at some session.
-  // Otherwise the first session loads it: to wait for a server, the service would have to watch for
-  // its socket all the time.
+  // Load the module now if there is a socket. Also try if the module is missing: the error is then
+  // logged at the start, and not during a session. Otherwise the first session loads the module: to
+  // wait for a server, the service would have to watch for its socket all the time.
   if (hasServerSocket() || !isModuleThere()) load(kLongestOpening);
 }
 
@@ -53,7 +54,7 @@ std::shared_ptr<const Reading> PipeWireOnDemand::read() {
 
 void PipeWireOnDemand::sampled() {
   if (source_ != nullptr || isDisabled_) return;
-  // Does not wait: other sessions' samples would wait with it.
+  // Do not wait for the server: other sessions' samples would wait, too.
   load(std::chrono::milliseconds::zero());
   if (source_ == nullptr) return;
   // While no session holds a reading, the source need not follow the server.

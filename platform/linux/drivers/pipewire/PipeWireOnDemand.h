@@ -18,8 +18,8 @@ namespace halvox::platform::linux_ {
 //      |
 //      +--the module cannot be loaded--> disabled (until the next start)
 //
-// Waiting and disabled, its only channels are the `connections` of a source that has not reached a
-// server. Belongs to the thread of its reader.
+// While it is waiting or disabled, its only channels are the `connections` of a source that has not
+// reached a server. Belongs to the thread of its reader.
 class PipeWireOnDemand final : public DriverSource {
  public:
   // `log` must outlive the source.
@@ -35,12 +35,12 @@ class PipeWireOnDemand final : public DriverSource {
 
   void load(std::chrono::milliseconds longestOpening);
 
-  LogCategory& category_;  // of the loaded source too
+  LogCategory& category_;  // also used by the loaded source
   const ObjectLog log_;
   std::array<ChannelList::Channel, 2> connections_;
   bool isDisabled_ = false;
   std::unique_ptr<DriverSource> source_;  // once loaded
-  std::weak_ptr<Lease> lease_;            // of the readings before that
+  std::weak_ptr<Lease> lease_;            // of the readings before it was loaded
   ReadingMaker maker_;
 };
 

@@ -26,10 +26,10 @@ std::string maps() {
   return {std::istreambuf_iterator<char>(file), {}};
 }
 
-// The module stays loaded once a test has loaded it, so the steps of a life are one test.
+// All steps are in one test, because the module stays loaded once a test has loaded it.
 TEST(PipeWireOnDemandTest, TheModuleIsLoadedForTheFirstSampleAndNotToFindChannels) {
   FakePlatform platform;
-  const ScratchDirectory directory;  // without a server's socket
+  const ScratchDirectory directory;  // has no server's socket
   ::setenv("PIPEWIRE_REMOTE", (directory.path() / "no-server").c_str(), 1);
   PipeWireOnDemand source(driversCategory(platform.log));
 

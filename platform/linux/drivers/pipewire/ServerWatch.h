@@ -15,9 +15,9 @@ namespace halvox::platform::linux_ {
 // socket.
 //
 // The environment at construction decides where that is, by the library's own rules. It watches
-// only between begin() and end(), with inotify instead of a timer, so that waiting for a server
-// costs nothing. Belongs to the loop's thread, or to a caller that knows that this thread does not
-// run. GraphFollower owns it. Without the directory, or without inotify, it never calls back.
+// only between begin() and end(), with inotify instead of a timer, which makes waiting for a server
+// free. Belongs to the loop's thread, or to a caller that knows that this thread does not run.
+// GraphFollower owns it. Without the directory, or without inotify, it never calls back.
 class ServerWatch {
  public:
   // `onAppeared` may call end().
@@ -26,7 +26,7 @@ class ServerWatch {
   ServerWatch(const ServerWatch&) = delete;
   ServerWatch& operator=(const ServerWatch&) = delete;
 
-  // Starts to watch, or tries again. Does nothing while it watches.
+  // Starts to watch, or tries again if that failed. Does nothing if it is already watching.
   void begin();
   void end();
 

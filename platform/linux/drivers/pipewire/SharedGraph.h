@@ -13,9 +13,9 @@ struct SharedGraph {
   Mutex mutex{};
   Condition settled{};
   GraphStatistics statistics HALVOX_GUARDED_BY(mutex){};
-  // Each reading holds a copy. It is expired if nobody holds a reading.
+  // Each reading holds a copy. Expired if no reading is held.
   std::weak_ptr<void> lease HALVOX_GUARDED_BY(mutex){};
-  bool isSettled HALVOX_GUARDED_BY(mutex) = false;  // the server was asked once, or is missing
+  bool isSettled HALVOX_GUARDED_BY(mutex) = false;  // the server has answered once, or is missing
   bool isProfiling HALVOX_GUARDED_BY(mutex) = false;
 };
 

@@ -16,7 +16,7 @@
 // Shared by the tests of this folder.
 namespace halvox::platform::linux_::testing {
 
-// A source with the readings that a test makes.
+// A source that returns the readings that a test has made.
 class MadeSource final : public DriverSource {
  public:
   using Make = std::function<std::shared_ptr<const Reading>()>;
@@ -106,7 +106,7 @@ inline std::vector<std::string> describe(const DriverSamples& samples) {
   return lines;
 }
 
-// Samples with all channels of a reading.
+// Returns samples with all channels of a reading.
 inline DriverSamples samplesOf(std::shared_ptr<const Reading> reading) {
   auto all = std::make_shared<ChannelSelection>();
   for (std::uint32_t index = 0; index < reading->channels->size(); ++index) all->push_back(index);

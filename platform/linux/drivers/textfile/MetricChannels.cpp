@@ -97,8 +97,8 @@ class ChannelMaker {
   }
 
  private:
-  // The counter of that name. OpenMetrics names the family without "_total", the older format with
-  // it.
+  // Returns the counter of that name. OpenMetrics names the family without "_total", the older
+  // format with it.
   const MetricFamily* counterNamed(const std::string& name) const {
     for (const std::string& form : {name, name + "_total"}) {
       const auto found = byName_.find(form);
@@ -112,8 +112,8 @@ class ChannelMaker {
   // The counters of a state set become part of its channel, not channels of their own.
   void claimStateCounters(const MetricFamily& family) {
     if (family.type != MetricType::kStateset) return;
-    // A counter that is missing claims null, which is no family's address. addStateChannel()
-    // reports it.
+    // A missing counter inserts null, which is not the address of any family. addStateChannel()
+    // reports the error.
     claimed_[counterNamed(family.name + "_residency")] = true;
     claimed_[counterNamed(family.name + "_transitions")] = true;
   }
@@ -144,7 +144,7 @@ class ChannelMaker {
     }
   }
 
-  // A NaN means that the gauge has no value at the moment. There is no channel then.
+  // NaN means that the gauge has no value at the moment. It then gets no channel.
   void addGauge(const MetricFamily& family) {
     for (const MetricSample& sample : family.samples) {
       const auto value = sample.number.cutDown();
@@ -167,7 +167,8 @@ class ChannelMaker {
   void addStateChannel(const MetricFamily& family, const MetricLabels& labels,
                        const std::vector<const MetricSample*>& samples);
   std::uint64_t stateCount(const MetricFamily& counter, const MetricSample& state);
-  // Two channels of one name would have one key in a report, and one of them would be lost.
+  // Two channels with the same name would have the same key in a report, and one of them would be
+  // lost.
   void refuseDoubles() const;
 
   const OpenMetricsText::Families& families_;
@@ -193,8 +194,8 @@ class BucketReader {
     if (!buckets_.empty() && upper <= lower_) {
       refuse(sample.line, "expected a greater bound than that of the previous bucket");
     }
-    // Counts of OpenMetrics include those of all lower buckets. A smaller one would become a
-    // negative difference.
+    // The count of a bucket includes those of all lower buckets. If it were smaller than the
+    // previous one, the difference would be negative.
     if (hits < total_) refuse(sample.line, "expected at least the hits of the previous bucket");
     buckets_.push_back({lower_, upper});
     values_.push_back(hits - total_);
@@ -220,8 +221,8 @@ class BucketReader {
     if (isComplete_) return kIOReportNoUpperBound;
     const auto number = MetricNumber::parse(text);
     const auto whole = number.has_value() ? number->cutDown() : std::nullopt;
-    // The bounds of a report's buckets are integers. A fraction that is rounded would move hits to
-    // another bucket.
+    // The bounds of a report's buckets are integers. Rounding a fraction would move hits to another
+    // bucket.
     if (!whole.has_value() || *whole < 0 || static_cast<double>(*whole) != number->value) {
       refuse(sample.line, "expected a whole number or +Inf as the bucket's bound");
     }
@@ -289,7 +290,7 @@ void ChannelMaker::addStateChannel(const MetricFamily& family, const MetricLabel
       refuse(sample->line, "expected 0 or 1 as the value of a state");
     }
     channel.description.states.push_back(labelOf(*sample, family.name));
-    // In this order, in which readings hold the numbers of a state.
+    // Keep this order, in which a reading holds the numbers of a state.
     channel.values.push_back(stateCount(*transitions, *sample));
     channel.values.push_back(stateCount(*residency, *sample));
   }

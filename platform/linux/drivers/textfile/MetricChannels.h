@@ -29,7 +29,7 @@ struct MetricChannel {
 //
 // The labels driver, group, subgroup, channel and unit name the channel. Any other label is
 // appended to the channel's name. Metrics of other types are ignored. Pure functions; any thread
-// may call.
+// may call them.
 class MetricChannels {
  public:
   // The channels, or the first error. A text with a contradiction gives no channel at all: half of

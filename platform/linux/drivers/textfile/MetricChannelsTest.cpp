@@ -186,7 +186,7 @@ std::string threeMetrics(const std::string& type, const std::string& counters) {
   return states + residency + transitions;
 }
 
-// The CPU time of this thread, so that other work of the machine does not count.
+// The CPU time of this thread: other work on the machine does not count.
 double secondsToRead(const std::string& text) {
   const auto now = [] {
     timespec time{};
@@ -200,7 +200,7 @@ double secondsToRead(const std::string& text) {
 }
 
 TEST(MetricChannelsTest, StatesAreFoundAmongManyWithoutLookingAtAll) {
-  // The time for as many values of a type that makes no channels.
+  // The time for the same number of values of a type that makes no channels.
   const double plain = secondsToRead(threeMetrics("info", "unknown"));
   const double states = secondsToRead(threeMetrics("stateset", "counter"));
 

@@ -118,7 +118,7 @@ MetricLabels parseLabels(LineCursor& line) {
     if (!line.skip(',') && !line.startsWith('}')) throw Mistake{"expected , or } after the label"};
     line.skipBlanks();
   }
-  // Sorted, because labels in another order name the same series.
+  // Sort the labels: the same labels in another order name the same series.
   std::ranges::sort(labels);
   const auto twice = std::ranges::adjacent_find(labels, {}, &MetricLabel::name);
   if (twice != labels.end()) throw Mistake{"the label " + twice->name + " appears twice"};
@@ -157,7 +157,7 @@ std::optional<MetricType> typeNamed(std::string_view name) {
   return found->second;
 }
 
-// Parses one text. Used once. The first error ends it: a file that has one is not used at all.
+// Parses one text. Used once. Stops at the first error: a file that has one is not used at all.
 class Parser {
  public:
   std::variant<OpenMetricsText::Families, MetricError> parse(std::string_view text) {
@@ -328,11 +328,12 @@ class Parser {
 std::optional<MetricNumber> MetricNumber::parse(std::string_view text) {
   if (const auto named = namedNumber(text)) return MetricNumber{*named, std::nullopt};
   std::string_view digits = text;
-  // OpenMetrics allows a plus sign, std::from_chars() does not.
+  // OpenMetrics allows a plus sign, but std::from_chars() does not.
   if (digits.starts_with('+')) digits.remove_prefix(1);
   const bool isSigned = digits.starts_with('-') && digits.size() == text.size();
   const std::size_t first = isSigned ? 1 : 0;
-  // std::from_chars() would also take names of infinities, which are handled above.
+  // Without this test, std::from_chars() would also accept the names of infinities, which are
+  // handled above.
   if (digits.size() <= first || (!isDigit(digits[first]) && digits[first] != '.')) {
     return std::nullopt;
   }

@@ -25,9 +25,10 @@ struct MetricNumber {
   double value = 0;
   std::optional<std::int64_t> whole{};
 
-  // None if the text is not a number.
+  // Returns std::nullopt if the text is not a number.
   [[nodiscard]] static std::optional<MetricNumber> parse(std::string_view text);
-  // The number rounded down to an integer; none if 64 bits cannot hold it, or for a NaN.
+  // Returns the number rounded down to an integer; std::nullopt for NaN, or if 64 bits cannot hold
+  // it.
   [[nodiscard]] std::optional<std::int64_t> cutDown() const;
 };
 
@@ -65,9 +66,9 @@ struct MetricError {
 // Parses metrics in the OpenMetrics text format, or in the older format of exporters' text files,
 // which has no "# EOF".
 //
-// Anyone may write these files, so nothing is trusted: everything that is not as the format demands
-// is an error, and all sizes are bounded. The bounds are far above real files; they keep one file
-// from taking the service's memory or its 50 ms. Pure functions; any thread may call.
+// Any program may write these files, and their content is not trusted: whatever the format does not
+// allow is an error, and all sizes are bounded. The bounds are far above real files; they keep one
+// file from using up the service's memory or its 50 ms. Pure functions; any thread may call them.
 class OpenMetricsText {
  public:
   static constexpr std::size_t kLargestText = 1U << 20U;

@@ -52,7 +52,7 @@ void RemovedFiles::watch() {
   if (!inotify_) inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (inotify_) watched_ = ::inotify_add_watch(inotify_.get(), directory_.c_str(), kEvents);
   if (watched_ != -1) return;
-  // A directory that cannot be opened has no files either, so there is nothing to log.
+  // Do not log this: a directory that cannot be opened gives no files either.
   const bool isNoDirectory = errno == ENOENT || errno == ENOTDIR || errno == EACCES;
   if (isNoDirectory || std::exchange(isFailureLogged_, true)) return;
   log_.error("cannot watch the directory ", directory_.string(),

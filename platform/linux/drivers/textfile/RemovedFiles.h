@@ -13,8 +13,8 @@ namespace halvox::platform::linux_ {
 // Finds out which files were deleted from a directory since the last call, even if files with the
 // same names exist again. Renaming a file over another one updates that one and does not delete it.
 //
-// It uses inotify, but no thread waits for it: the kernel keeps the names until someone asks, so an
-// idle service makes no wake-ups. Belongs to one thread; the source owns it.
+// It uses inotify, but no thread waits for it: the kernel keeps the names until the next call. An
+// idle service therefore does not wake up. Belongs to one thread; the source owns it.
 //
 // Without the directory it reports nothing, and watches the directory once it exists. Without
 // inotify it reports nothing either, which is logged once.
@@ -30,7 +30,7 @@ class RemovedFiles {
   RemovedFiles(std::filesystem::path directory, LogCategory& log)
       : directory_(std::move(directory)), log_(log, "RemovedFiles") {}
 
-  // The files since the last call; none the first time. Does not block.
+  // Returns the files that were deleted since the last call; none the first time. Does not block.
   [[nodiscard]] Removed take();
 
  private:

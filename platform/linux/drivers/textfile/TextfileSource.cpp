@@ -55,7 +55,7 @@ std::shared_ptr<const Reading> TextfileSource::read() {
   // For all files together: fifty large ones, each within its own bound, took the service to half a
   // gigabyte.
   std::size_t room = kMostBytes;
-  // Before the files are listed: whatever is deleted after this is noticed at the next reading.
+  // Do this before listing the files: a deletion after this is noticed at the next reading.
   forgetRemoved();
   const UniqueFd directory = openDirectory(directory_.c_str());
   for (const std::string& file : directory ? list(directory.get()) : std::vector<std::string>()) {
@@ -93,7 +93,7 @@ std::vector<std::string> TextfileSource::list(int directory) {
     const std::string_view name = found->d_name;
     if (name.ends_with(".prom") && !name.starts_with('.')) files.emplace_back(name);
   }
-  // The order decides which file has a channel that several files define. It must not change
+  // Sort the files, because the first one that defines a channel has it. The order must not change
   // between two readings.
   std::ranges::sort(files);
   const bool areTooMany = files.size() > kMostFiles;
@@ -126,7 +126,7 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
   if (isSame && entry.isSettled) return;
   if (!isSame) entry.complaint.clear();
   entry.state = state;
-  // Until then the file is read again each time, because its time may not show another change.
+  // Until then, read the file again each time: its time may not show another change.
   entry.isSettled = state.error != 0 || now() - state.changedAt > kTimeStep;
   if (!state.hasRoom) {
     isChanged_ |= std::exchange(entry.isGood, false);
@@ -190,7 +190,7 @@ void TextfileSource::chooseChannels() {
     for (std::size_t index = 0; index < entry.channels.size(); ++index) {
       if (seen.insert(entry.channels[index]->fullName()).second) continue;
       entry.isShown[index] = false;
-      // One line for each file, however many channels it shares with others.
+      // Log one line for each file, even if it shares several channels with others.
       if (entry.complaint.empty()) {
         complain(file,
                  ": an earlier file also has the channel " + *entry.channels[index]->channelName +

@@ -74,7 +74,7 @@ TEST_F(TextfileSourceTest, AFileThatIsWrittenInPlaceIsNoticedEvenWithinOneTick) 
 }
 
 TEST_F(TextfileSourceTest, FilesBeyondTheRoomAreSkippedUntilThereIsRoom) {
-  // Each is as large as a file may be, so that all of them together use up the room.
+  // Each is as large as a file may be. Together they use up the room.
   for (int number = 0; number < 8; ++number) {
     const std::string name = "level" + std::to_string(number);
     std::string text = "# TYPE " + name + " gauge\n" + name + " 5\n";
@@ -144,7 +144,7 @@ TEST_F(TextfileSourceTest, ChannelsOfADeletedFileVanishAndAreNewWhenTheyReturn) 
               IsEmpty());
 }
 
-// Whether or not the directory was read in between.
+// The result is the same whether or not the directory was read in between.
 TEST_F(TextfileSourceTest, AFileThatIsDeletedAndWrittenAgainBetweenTwoReadingsHasOtherChannels) {
   for (const int count : {2, 10}) {
     writePulses("a.prom", 3);

@@ -14,7 +14,7 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// False when the frame could not be written.
+// Returns false if the frame could not be written.
 bool print(bool written, std::string_view frame, std::string_view body) {
   if (written) std::cout << hexadecimal(frame) << '\t' << body << '\n';
   return written;
