@@ -57,12 +57,23 @@ class MarkedService(Service):
         """The codes of all marks in order. Each mark has four arguments of 0."""
         self.must("stop")
         self.must("destroy")
-        shown = subprocess.run(["babeltrace2", str(self.trace)], env=self.tracer, capture_output=True,
-                               text=True, timeout=DEADLINE, check=True).stdout
+        shown = self.shown_trace()
         events = [EVENT.search(line) for line in shown.splitlines()]
         if not all(events) or any(event.groups()[1:] != ("0",) * 4 for event in events):
             raise AssertionError(shown)
         return [int(event[1], 16) for event in events]
+
+    def shown_trace(self):
+        """The trace as text. The tracer may still be writing it when its session is destroyed."""
+        def show():
+            return subprocess.run(["babeltrace2", str(self.trace)], env=self.tracer,
+                                  capture_output=True, text=True, timeout=DEADLINE, check=False)
+        with contextlib.suppress(AssertionError):
+            wait_for("a trace that can be read", lambda: show().returncode == 0)
+        done = show()
+        if done.returncode != 0:
+            raise AssertionError(done.stderr)
+        return done.stdout
 
 
 @contextlib.contextmanager
