@@ -3,7 +3,7 @@
 
 #include "client/ClientWorker.h"
 
-// The connection of the worker: how it is made, what is sent over it and what comes back.
+// The part of the worker that connects, sends and receives.
 namespace halvox::client {
 namespace {
 

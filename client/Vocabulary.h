@@ -107,7 +107,7 @@ std::string categoryName(Category category);
 std::string_view eventTypeName(EventType type);
 std::string_view serviceTypeName(ServiceType type);
 
-// Return the number of a name in upper or lower case; nothing for an unknown name.
+// Return the number of a name, ignoring case; std::nullopt for an unknown name.
 std::optional<Category> findCategory(std::string_view name);
 std::optional<EventType> findEventType(std::string_view name);
 std::optional<ServiceType> findServiceType(std::string_view name);

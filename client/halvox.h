@@ -51,7 +51,7 @@ extern "C" {
 
 /* A connection to the service, with its own thread and sessions. */
 typedef struct halvox_client halvox_client;
-/* Values under text keys: a message or a configuration. A key occurs once. */
+/* Values with text keys: a message or a configuration. A key occurs only once. */
 typedef struct halvox_dictionary halvox_dictionary;
 /* A list of values, which may be of different types. */
 typedef struct halvox_array halvox_array;
@@ -152,8 +152,8 @@ HALVOX_API size_t halvox_category_name(uint32_t category, char* buffer, size_t s
 HALVOX_API const char* halvox_event_type_name(uint16_t type);
 HALVOX_API const char* halvox_service_type_name(uint16_t type);
 
-/* Look up the number of a name, in upper or lower case, and store it. Return false and store
- * nothing if the name is unknown or an argument is NULL. */
+/* Look up the number of a name, ignoring case, and store it. Return false and store nothing if the
+ * name is unknown or an argument is NULL. */
 HALVOX_API bool halvox_find_category(const char* name, uint32_t* category);
 HALVOX_API bool halvox_find_event_type(const char* name, uint16_t* type);
 HALVOX_API bool halvox_find_service_type(const char* name, uint16_t* type);

@@ -49,7 +49,7 @@ class TestService {
   [[nodiscard]] std::size_t count(std::string_view member);
   // Waits for `count` requests of that member. Returns false if they do not arrive in time.
   [[nodiscard]] bool waitForCalls(std::string_view member, std::size_t count);
-  // The members of all requests in their order, separated by blanks.
+  // Returns the members of all requests in their order, separated by blanks.
   [[nodiscard]] std::string members();
 
  private:

@@ -10,9 +10,9 @@ namespace halvox::platform::linux_ {
 // and nothing above U+10FFFF. All functions take any bytes, and any thread may call them.
 //
 // The inner ring cannot include this header. session/SummaryFileName.cpp has a line of its own,
-// which cuts valid text between two characters. The fake of the process service has its own
-// replacement of invalid bytes too: the contract suite compares it with what the adapter does by
-// means of this header.
+// which cuts valid text between two characters. The fake process service also has code of its own,
+// which replaces invalid bytes. The contract suite compares its results with those of the adapter,
+// which uses this header.
 
 // One step through bytes that should be UTF-8.
 struct Utf8Step {

@@ -80,7 +80,7 @@ struct Configuration {
   Limits limits;
   Drivers drivers;
   std::filesystem::path preferencesDirectory;  // [preferences]: <directory>/<user>/<domain>.toml
-  std::filesystem::path notifyDirectory;       // [notify]: files that post by their names
+  std::filesystem::path notifyDirectory;       // [notify]: a file here posts by its name
   LogLevel logLevel = LogLevel::kDefault;
   // The lowest level of the lines that the log keeps in memory for captures of diagnostics.
   LogLevel logMemoryLevel = LogLevel::kInfo;

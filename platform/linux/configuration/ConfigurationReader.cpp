@@ -35,7 +35,8 @@ std::string found(const toml::node& node) {
 }
 
 std::size_t editDistance(std::string_view left, std::string_view right) {
-  // One row of the usual table is enough: each number depends on this row and the one before.
+  // One row of the usual table is enough: each number depends only on its own row and the previous
+  // one.
   std::vector<std::size_t> row(right.size() + 1);
   std::iota(row.begin(), row.end(), std::size_t{0});
   for (std::size_t i = 0; i < left.size(); ++i) {

@@ -209,8 +209,8 @@ void ConnectionHost::readMail() {
 void ConnectionHost::acceptPeer(UniqueFd fd, const PeerCredentials& credentials) {
   auto peer =
       std::make_shared<PeerConnection>(*this, nextClientNumber(), std::move(fd), credentials);
-  // Add it before asking the delegate: a peer that the delegate refuses removes itself from the
-  // map.
+  // Add the peer before asking the delegate: a peer that the delegate refuses removes itself from
+  // the map.
   peers_.emplace(peer.get(), peer);
   peer->start();
   static_cast<void>(admit(peer));

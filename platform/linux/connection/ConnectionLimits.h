@@ -17,12 +17,12 @@ inline constexpr std::size_t kMiB = 1024 * kKiB;
 // client at the bound would stop and start with every request, and each start costs a wake-up.
 inline constexpr std::size_t kMaxOpenRequests = 1024;
 inline constexpr std::size_t kMaxOpenRequestBytes = 4 * kMiB;
-// How many requests a request counts as if its answer is a list that grows with the number of
-// sessions. Otherwise a few thousand bytes of requests could ask for gigabytes of answers.
+// A request whose answer is a list that grows with the number of sessions counts as this many
+// requests. Otherwise a few thousand bytes of requests could ask for gigabytes of answers.
 inline constexpr std::size_t kListRequestWeight = 64;
 
 // Flow control also stops reading from a client that does not read: each of its requests would add
-// a reply to the memory. It reads again when half of the replies have been taken by the socket.
+// a reply to the memory. It reads again when the socket has taken half of the replies.
 inline constexpr std::size_t kMaxUnreadReplies = 256;
 inline constexpr std::size_t kMaxUnreadReplyBytes = 4 * kMiB;
 

@@ -19,7 +19,7 @@
 
 namespace halvox::platform::linux_ {
 
-// What a client of the service asked for. All of it goes into the archive.
+// The request of a client. All of it is stored in the archive.
 struct SnapshotRequest {
   Date time;
   Dictionary signature;
@@ -28,7 +28,7 @@ struct SnapshotRequest {
   std::optional<Dictionary> payload{};
 };
 
-// Where the parts of a snapshot come from, and how long two of them may take.
+// The sources of the parts of a snapshot, and the time limits of two parts.
 struct SnapshotSources {
   SystemPaths paths;
   std::function<LogMemory::Contents()> log{};      // empty: no log is kept in memory

@@ -27,7 +27,7 @@ constexpr int kNiceness = 10;
 constexpr const char* kBusy = "another snapshot is being taken";
 constexpr const char* kEnding = "the service is ending";
 
-// A snapshot that was taken.
+// A finished snapshot.
 struct Snapshot {
   std::filesystem::path path;
   std::uint64_t size;

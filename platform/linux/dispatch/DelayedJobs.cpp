@@ -119,7 +119,7 @@ void DelayedJobs::runDue(const Job& job) {
     const MutexLock lock(mutex_);
     isStopped = isStopped_;
   }
-  // The job was posted before the stop, but its turn came after it.
+  // The job was posted before the stop, but would only run after the stop.
   if (isStopped) return pool_.runner().countDiscarded(1);
   const DispatchThread::Working working(nullptr, "delayed");
   pool_.runner().run(job);

@@ -15,8 +15,8 @@ class JobRunner {
   // Both services must outlive the runner.
   JobRunner(LogService& log, StatisticsService& statistics);
 
-  // Runs one job. An exception is logged with the queue's label, counted, and goes no further: one
-  // bad job must not end the queue of all others.
+  // Runs one job. An exception is logged with the queue's label, counted and not passed on: one bad
+  // job must not stop the queue.
   void run(const Job& job) noexcept {
     try {
       job();

@@ -194,7 +194,7 @@ bool OwnThreadQueue::takeBatch() {
   if (next_ < batch_.size()) return true;
   batch_.clear();
   next_ = 0;
-  // Do this before the swap: jobs are added next to the vector that is empty now.
+  // Shrink before the swap, which makes this empty vector the one to which jobs are added next.
   if (batch_.capacity() > kKeptCapacity) batch_.shrink_to_fit();
   batch_.swap(waiting_);
   return true;

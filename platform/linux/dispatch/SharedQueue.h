@@ -63,7 +63,7 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
   const QualityOfService quality_;
   Mutex mutex_;
   std::deque<Job> jobs_ HALVOX_GUARDED_BY(mutex_);
-  bool hasTurn_ HALVOX_GUARDED_BY(mutex_) = false;  // a turn is noted, in the run queue or running
+  bool hasTurn_ HALVOX_GUARDED_BY(mutex_) = false;  // a turn is noted, queued or running
   bool isWaiting_ HALVOX_GUARDED_BY(mutex_) = false;
 };
 

@@ -7,7 +7,7 @@
 
 namespace halvox::platform::linux_ {
 
-// One place that driver counters come from.
+// A source of driver counters.
 //
 // Its SourceReader owns it and calls it on a thread that serves only this source: a source that
 // waits for a disk or a driver then delays no other source. A failure makes a reading smaller; the

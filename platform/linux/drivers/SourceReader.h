@@ -68,7 +68,7 @@ class SourceReader {
  private:
   using ReadingPointer = std::shared_ptr<const Reading>;
 
-  // Null if the reading is late. Sets whether the source was in time before.
+  // Returns null if the reading is late. Sets `isFirstLate` if the source was in time before.
   [[nodiscard]] ReadingPointer receive(const Asked& asked, bool& isFirstLate);
   void run();
   void makeReadings() HALVOX_REQUIRES(mutex_);

@@ -15,7 +15,7 @@
 
 namespace halvox::platform::linux_ {
 
-// A message that came back, with its texts in its own storage.
+// A received message, with its texts in its own storage.
 struct RawAnswer {
   dbus::MessageType type = dbus::MessageType::kMethodReturn;
   std::uint32_t replySerial = 0;

@@ -38,7 +38,7 @@ class TestObject final : public ExportedObject {
   std::vector<ReplyCallback> held_ HALVOX_GUARDED_BY(mutex_);
 };
 
-// Methods, in words:
+// The methods:
 //   echo s → s        the text again, at once
 //   away s → s        the text again, from another thread
 //   twice s → s       the text, two times

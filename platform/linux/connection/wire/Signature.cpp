@@ -23,8 +23,8 @@ Role roleOf(char code) { return kRoles[static_cast<unsigned char>(code)]; }
 
 bool isBasic(char code) { return roleOf(code) == Role::kBasic || code == 'h'; }
 
-// Goes over complete types, and notes what is unsupported in them. Recursion is bounded by the
-// length of a signature.
+// Scans complete types, and records whether one is unsupported. Recursion is bounded by the length
+// of a signature.
 class TypeScanner {
  public:
   explicit TypeScanner(std::string_view text) : text_(text) {}

@@ -127,7 +127,8 @@ Value Decoder::decodeContainer(std::string_view type, unsigned level) {
                   "containers nested more than 64 levels deep are not supported", type);
   }
   if (type.front() == 'v') return decodeVariant(level);
-  // Before the array: D-Bus has no other type for data, and bytes are copied as a block.
+  // Test for data before testing for an array: D-Bus has no other type for data, and bytes are
+  // copied as a block.
   if (type == "ay") return decodeData();
   if (type.starts_with("a{s")) return decodeDictionary(type, level);
   // Dictionaries with other keys are valid on the wire, but ours have texts as keys.
@@ -214,7 +215,7 @@ Value Decoder::decodeDictionary(std::string_view type, unsigned level) {
 }
 
 void Decoder::decodeEntry(std::string_view type, unsigned level) {
-  // Of a{s…}, what is between the key's type and the closing brace.
+  // Of a{s…}, the part between the key's type and the closing brace.
   const std::string_view valueType = type.substr(3, type.size() - 4);
   std::string_view key;
   if (!reader_.align(8) || !reader_.readText(key)) {
@@ -237,8 +238,8 @@ DecodeError Decoder::error() const {
   error.message = error.key + (error.key.empty() ? "" : ": ");
   error.message += problem_;
   error.message += " (signature \"" + error.signature + "\"";
-  // An unsupported value is found by its key. Of broken bytes, nothing but their place may be
-  // known.
+  // The path of an unsupported value is made of keys. For broken bytes, nothing but their place may
+  // be known.
   if (kind_ == Kind::kMalformed) {
     error.message += ", byte " + std::to_string(reader_.position()) + " of the body";
   }
@@ -272,7 +273,8 @@ std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expec
 std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expectedSignature,
                                       std::vector<Value>& arguments, DecodeScratch& scratch) {
   arguments.clear();
-  // Before the body is read: a client with wrong arguments gets an error and stays connected.
+  // Check this before the body is read: a client with wrong arguments gets an error and stays
+  // connected.
   if (frame.header.signature != expectedSignature) {
     return wrongSignature(frame.header.signature, expectedSignature);
   }
@@ -282,7 +284,8 @@ std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expec
     error = decoder.error();
     arguments.clear();
   }
-  // After an error too: the values of a message that was refused must not live until the next one.
+  // Release the values after an error too: those of a refused message must not live until the next
+  // message.
   scratch.clear();
   return error;
 }

@@ -180,7 +180,7 @@ bool ValueEncoder::appendStringAs(char code, const Value& value) {
     appendSignature(text);
     return true;
   }
-  // Before anything is appended: the wire has 32 bits for a length.
+  // Check this before anything is appended: the wire has only 32 bits for a length.
   if (text.size() > kMaxMessageBytes) return false;
   if (!(code == 'o' ? isObjectPath(text) : isUtf8WithoutNul(text))) return false;
   appendText(text);
@@ -232,7 +232,7 @@ bool ValueEncoder::appendArray(std::string_view type, const Array& array, unsign
 bool ValueEncoder::appendDictionary(std::string_view type, const Dictionary& dictionary,
                                     unsigned level) {
   const std::string_view valueType = type.substr(3, type.size() - 4);
-  // Counted although D-Bus does not: some readers do, and would refuse the message.
+  // Count this level although D-Bus does not: some readers count it, and would refuse the message.
   const unsigned entryLevel = level + 1;
   if (entryLevel > kMaxNesting) return false;
   std::size_t lengthPosition = 0;

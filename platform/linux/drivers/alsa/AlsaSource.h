@@ -13,7 +13,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Reads what the kernel reports about sound cards below /proc/asound and /sys/class/sound.
+// Reads what the kernel reports about sound cards, below /proc/asound and /sys/class/sound.
 //
 //   group                     subgroup      channels
 //   "Tx" playback,            the PCM       "frames", "application frames", "state"

@@ -39,7 +39,7 @@ class PipeWireOnDemand final : public DriverSource {
   const ObjectLog log_;
   std::array<ChannelList::Channel, 2> connections_;
   bool isDisabled_ = false;
-  std::unique_ptr<DriverSource> source_;  // once loaded
+  std::unique_ptr<DriverSource> source_;  // null until the module is loaded
   std::weak_ptr<Lease> lease_;            // of the readings before it was loaded
   ReadingMaker maker_;
 };

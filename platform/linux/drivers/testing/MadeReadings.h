@@ -70,8 +70,8 @@ inline std::shared_ptr<const Reading> makeReading(std::vector<ChannelList::Chann
   return reading;
 }
 
-// A channel as one line:
-//   driver/group/subgroup/name unit = what its format has
+// Returns a channel as one line:
+//   driver/group/subgroup/name unit = the values of its format
 inline std::string describe(const IOReportChannel& channel) {
   std::string text;
   for (const auto part : {channel.driverName, channel.group, channel.subGroup}) {

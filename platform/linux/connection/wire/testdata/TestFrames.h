@@ -25,8 +25,8 @@ inline std::string fromHex(std::string_view hex) {
   return bytes;
 }
 
-// Puts values on the wire one by one and lets tests break any rule. Made for tests alone, so that
-// what it says does not depend on the code that it tests.
+// Puts values on the wire one by one and lets tests break any rule. Shares no code with the
+// encoder, because tests must not trust the code under test.
 class WireBytes {
  public:
   explicit WireBytes(bool bigEndian = false) : bigEndian_(bigEndian) {}
