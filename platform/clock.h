@@ -6,7 +6,7 @@
 
 namespace halvox::platform {
 
-// A point in time as people in one time zone write it.
+// A point in time in the notation of one time zone.
 struct LocalTime {
   int year = 1970;
   int month = 1;  // from 1
@@ -29,8 +29,9 @@ class ClockService {
   // The wall clock. It can jump in both directions while the process runs; measure intervals with
   // one of the uptimes.
   [[nodiscard]] virtual Date currentDate() const = 0;
-  // A date in the time zone of the platform. A date outside its calendar, or a NaN, gives the
-  // default LocalTime: dates come from clients, and a name made from one must not fail.
+  // A date in the time zone of the platform. A date outside the range of the calendar, or a NaN,
+  // results in the default LocalTime: dates come from clients, and making a name from a date must
+  // not fail.
   [[nodiscard]] virtual LocalTime localTime(Date date) const = 0;
   // Seconds since the system started, including time in which it was suspended.
   [[nodiscard]] virtual std::chrono::duration<double> systemUptime() const = 0;

@@ -32,9 +32,8 @@ struct Error {
 using ReplyCallback = std::function<void(const std::optional<Error>&, const Value&)>;
 
 // What the service holds because of one client's requests: the content of its sessions, and
-// messages that wait in queues. A message counts from the delivery of its request on. The
-// connection's thread reads it before it delivers a request and compares it with the configured
-// limits.
+// messages that wait in queues. A message counts as soon as its request is delivered. Before the
+// connection's thread delivers a request, it compares this use with the configured limits.
 struct ResourceUse {
   std::uint64_t bytes = 0;  // on the heap
   std::uint64_t sessions = 0;
@@ -53,8 +52,8 @@ class ExportedObject {
 
 // Stands for one request that has not been carried out. The job that carries the request out holds
 // it; when the last copy is destroyed, the request counts as carried out, whether it was answered
-// or not. A connection is read from only while few of its tokens exist. This is what keeps a client
-// from piling up work.
+// or not. A connection is read from only while few of its tokens exist. This limits the work that a
+// client can have pending.
 using RequestToken = std::shared_ptr<void>;
 
 // What a request has besides its arguments.
@@ -136,8 +135,8 @@ class NSXPCConnection {
   virtual void resume() = 0;
 };
 
-// Decides which new connections are accepted. Implemented by the service; it must outlive the
-// listener.
+// Decides which new connections are accepted. Implemented by the service. The delegate must outlive
+// the listener.
 class NSXPCListenerDelegate {
  public:
   virtual ~NSXPCListenerDelegate() = default;

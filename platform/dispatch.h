@@ -76,8 +76,8 @@ class DispatchService {
                                                            QueueThreading threading) = 0;
   // A new semaphore with that many signals in it.
   virtual std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals) = 0;
-  // Runs the job once after the delay, on the background pool, in no order with other jobs. A
-  // waiting job costs memory but no thread.
+  // Runs the job once after the delay, on the background pool, in no particular order with other
+  // jobs. A waiting job costs memory but no thread.
   virtual void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) = 0;
 };
 

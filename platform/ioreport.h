@@ -154,8 +154,8 @@ class IOReportSamples {
 };
 
 // One moment at which several subscriptions are sampled. All samples of a moment come from the same
-// reading of the counters. A report samples eight groups: with a reading for each, it took 0.98 ms
-// at the median (docs/decisions/0008).
+// reading of the counters. A report samples eight groups: with a reading for each group, a report
+// took 0.98 ms at the median (docs/decisions/0008).
 //
 // Its maker owns it and uses it on one thread at a time. Samples may outlive it. It must not
 // outlive the service.
@@ -173,8 +173,8 @@ class IOReportMoment {
 // return returns null; it sets `error` if it knows why, and leaves it unchanged otherwise.
 //
 // A channel is the same in two samples if its names, format, kind, unit, states and bucket bounds
-// are equal and the driver did not withdraw it in between. Anything weaker would subtract counts of
-// different things.
+// are equal and the driver did not withdraw it in between. A weaker condition would subtract counts
+// of different things.
 class IOReportService {
  public:
   using Channels = std::shared_ptr<const IOReportChannels>;

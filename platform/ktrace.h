@@ -40,10 +40,10 @@ class KtraceSession {
 // that it was started with. Its handlers run on that queue. It is also ended and destroyed there,
 // but not inside an event handler.
 //
-// Failure: a start that fails still counts as a start. A call that does not suit the session's
-// state does nothing; neither does a call without a session or after its destruction. Calls with a
-// result return an error then. All of these must be harmless, because requests of clients can cause
-// them.
+// Failure: a start that fails still counts as a start. A call that is not allowed in the session's
+// state does nothing. The same holds for a call without a session or after its destruction. Calls
+// with a result return an error then. All of these must be harmless, because requests of clients
+// can cause them.
 //
 // The composition root owns the service.
 class KtraceService {

@@ -21,7 +21,7 @@ namespace detail {
 std::string logPrefix(std::string_view unit, std::uint32_t line) {
   constexpr std::size_t kUnitWidth = 25;
   constexpr std::size_t kLineWidth = 5;
-  // By hand instead of with snprintf or fmt: every enabled line passes here.
+  // Build the prefix without snprintf or fmt, because every enabled line needs it.
   std::string prefix;
   if (unit.size() < kUnitWidth) prefix.append(kUnitWidth - unit.size(), ' ');
   prefix += unit;

@@ -24,8 +24,8 @@ class NotifyService {
   virtual ~NotifyService() = default;
 
   // Registers a handler for the life of the process. It runs on the queue after a post of that
-  // name, with the token of this registration. Posts that come close together may become one call.
-  // Sets `token` and returns 0; on failure, such as a name that cannot exist, returns an error and
+  // name, with the token of this registration. Posts in quick succession may become one call. Sets
+  // `token` and returns 0; on failure, such as a name that cannot exist, returns an error and
   // leaves `token` unchanged.
   virtual NotifyStatus notify_register_dispatch(std::string_view name, NotifyToken& token,
                                                 std::shared_ptr<DispatchQueue> queue,

@@ -17,7 +17,7 @@ class KQTraceConfig {
 
 // Receives the progress of a performance trace.
 //
-// Calls come on a thread of the service, never inside a call to the session. A trace that was
+// The service calls on one of its threads, never inside a call to the session. A trace that was
 // started ends in exactly one completion, with an error if recording or saving failed. A trace
 // whose start failed never completes.
 class KQTraceSessionDelegate {
@@ -45,8 +45,8 @@ class KQTraceSession {
  public:
   virtual ~KQTraceSession() = default;
 
-  // Keeps a weak reference to the delegate. An empty pointer ends the calls: a trace that was
-  // replaced must not answer for its successor.
+  // Keeps a weak reference to the delegate. An empty pointer ends the calls: the calls of a trace
+  // that was replaced must not be mistaken for those of its successor.
   virtual void setDelegate(std::weak_ptr<KQTraceSessionDelegate> delegate) = 0;
   // Both return at once, whatever the tracer does, and are carried out in the order of the calls.
   // The delegate learns how they ended.

@@ -39,7 +39,7 @@ void appendEscaped(std::string& text, char character) {
     text += character;
     return;
   }
-  // Write three octal digits always: a digit that follows must not be read as part of the escape.
+  // Always write three octal digits: a digit that follows must not be read as part of the escape.
   text += '\\';
   for (const unsigned shift : {6U, 3U, 0U}) {
     text += static_cast<char>('0' + ((static_cast<unsigned>(byte) >> shift) & 7U));

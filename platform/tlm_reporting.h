@@ -87,8 +87,8 @@ class TLMReportingService {
                                             const Dictionary& userInfo) = 0;
   // Begins to look for back-ends and returns. The callback is called exactly once, on a thread of
   // the framework: never inside this call, and never on the queue of the caller's job, which may be
-  // waiting for it. It may run before this call returns, and after everyone else has released the
-  // session. It must own what it uses.
+  // waiting for it. It may run before this call returns, and after all other holders have released
+  // the session. It must own what it uses.
   virtual void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) = 0;
   virtual TLMReportingOutcome TLMReportingSendMessage(const Session& session,
                                                       const TLMReportingMessage& message) = 0;

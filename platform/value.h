@@ -29,7 +29,7 @@ struct Date {
 // that the service tests by identity.
 //
 // Make constants only with static storage and before the first thread starts: the table of
-// constants has no lock. At most 64 bytes, each with a different text.
+// constants has no lock. Each has at most 64 bytes and a text of its own.
 class StringConstant {
  public:
   explicit StringConstant(std::string_view text);

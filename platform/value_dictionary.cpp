@@ -125,7 +125,7 @@ void Dictionary::makeRoomFor(std::size_t entries) {
   const bool alone = rep_->references.load(std::memory_order_acquire) == 1;
   if (alone && entries <= rep_->capacity) return;
   // The copy of a shared dictionary gets exactly the room that it needs, because it is usually
-  // changed once and then kept. One that grows entry by entry grows by half.
+  // changed once and then kept. A dictionary that grows entry by entry grows by half of its size.
   const std::size_t capacity =
       alone ? std::max<std::size_t>(entries, rep_->capacity + rep_->capacity / 2) : entries;
   Reference grown = allocateRep(capacity);

@@ -14,9 +14,9 @@ namespace halvox::platform {
 
 // Keeps the events that it was sent. At first it wants every name.
 //
-// The sender never builds a payload. That happens later, as in the store: when the test reads the
-// events, or only when the test asks for it. A test that reads a payload at once would otherwise
-// hide a builder with a dangling reference.
+// The sender never builds a payload. Like the store, the fake builds it later: when the test reads
+// the events, or when the test requests it. Building it in the sender's call would hide a builder
+// with a dangling reference.
 //
 // Any thread may call; the test reads on its own. FakePlatform owns it.
 class FakeAnalyticsService final : public AnalyticsService {
@@ -38,7 +38,7 @@ class FakeAnalyticsService final : public AnalyticsService {
   // Builds the payloads that have not been built, in the order of sending, on this thread. Releases
   // their builders.
   void buildPayloads() const;
-  // Forgets all questions and events, also those whose payloads have not been built.
+  // Forgets the tested names and all events, including those whose payloads have not been built.
   void clear();
 
   [[nodiscard]] std::vector<Event> events() const;

@@ -39,7 +39,8 @@ class FakeCall {
 
 class FakeConnectionService;
 
-// The user of a fake client's process: root or the service's own user, or another.
+// The user of a fake client's process. kOwner is root or the service's own user, kStranger any
+// other.
 enum class FakeUser : unsigned char { kOwner, kStranger };
 
 // A client's connection that the test controls: the test sends requests, interrupts and
@@ -52,10 +53,10 @@ class FakeConnection final : public NSXPCConnection {
   FakeConnection(Journal& journal, ProcessID pid, FakeUser user = FakeUser::kOwner)
       : journal_(journal), pid_(pid), user_(user) {}
 
-  // Delivers a request to the exported object. Returns it with the answers so far; later answers
-  // are added to it. A request that is for the owner is refused to a stranger. Throws if the
-  // connection was not resumed or has ended, if it has no such method, or if the number of
-  // arguments is not that of the method's signature.
+  // Delivers a request to the exported object. Returns the call with the answers so far; later
+  // answers are added to it. A request that is for the owner is refused to a stranger. Throws if
+  // the connection was not resumed or has ended, if the object has no such method, or if the number
+  // of arguments is not that of the method's signature.
   std::shared_ptr<FakeCall> call(std::string_view method, std::vector<Value> arguments = {});
   // The other end has disconnected, but the connection may be restored.
   void interrupt();

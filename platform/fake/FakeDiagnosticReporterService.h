@@ -34,7 +34,7 @@ class FakeDiagnosticReporterService final : public DiagnosticReporterService {
   // All requests in order, answered or not.
   [[nodiscard]] std::vector<Request> requests() const;
   // Gives the reply to the request of that index, on this thread. Throws if there is no such
-  // request or it has its reply.
+  // request or it has been answered.
   void reply(std::size_t index, const Dictionary& response);
   // The state of the service from the source that was set; none if there is no source, or if it did
   // not answer before it returned.

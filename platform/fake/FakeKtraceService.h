@@ -25,8 +25,8 @@ class FakeKtraceService final : public KtraceService {
   // Does not own the journal, which must outlive it.
   explicit FakeKtraceService(Journal& journal) : journal_(journal) {}
 
-  // Delivers those of these events that are in a session's ranges to that session, before the
-  // events that it recorded.
+  // Delivers to each session those of these events that are in its ranges, before the events that
+  // it recorded.
   void setEvents(std::vector<trace_point> events);
   // Emits an event: the sessions that record now keep it if it is in their ranges.
   void emit(const trace_point& event);

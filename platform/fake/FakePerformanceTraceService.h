@@ -19,7 +19,7 @@ namespace halvox::platform {
 // journal has the calls that sessions receive. Any thread may call. FakePlatform owns it.
 class FakePerformanceTraceService final : public PerformanceTraceService {
  public:
-  // Owns neither; both must outlive it and its sessions.
+  // Does not own its arguments, which must outlive it and its sessions.
   FakePerformanceTraceService(Journal& journal, DispatchService& dispatch)
       : journal_(journal), dispatch_(dispatch) {}
 

@@ -28,7 +28,7 @@
 namespace halvox::platform {
 
 // One fake of each platform service, installed while it exists. A test fixture has it as its first
-// member, so that it outlives the code under test. One at a time.
+// member, so that it outlives the code under test. Only one may exist at a time.
 struct FakePlatform {
   FakePlatform();
   FakePlatform(const FakePlatform&) = delete;

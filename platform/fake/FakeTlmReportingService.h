@@ -40,7 +40,7 @@ class FakeTlmReportingService final : public TLMReportingService {
   };
 
   // Does not own its arguments. The journal must outlive it, and the dispatch service must exist
-  // whenever it answers later.
+  // whenever this service answers later.
   FakeTlmReportingService(Journal& journal, FakeDispatchService& dispatch)
       : journal_(journal), dispatch_(dispatch) {}
 
@@ -49,7 +49,7 @@ class FakeTlmReportingService final : public TLMReportingService {
   void answerDiscoveries(Answering answering, std::optional<Array> backends = std::nullopt);
   // Answers the oldest discovery, on this thread. Returns false if none waits.
   bool answerDiscovery(const std::optional<Array>& backends);
-  // kLater is not for flushes.
+  // kLater is not allowed for flushes.
   void answerFlushes(Answering answering);
   // Ends the oldest flush, on this thread. Returns false if none waits.
   bool completeFlush();

@@ -30,9 +30,9 @@ struct JournalEntry {
   friend bool operator==(const JournalEntry&, const JournalEntry&) = default;
 };
 
-// The order in which calls reached the fakes, over all of them. Tests use it to check the order of
-// steps that go to different services. Any thread may record. FakePlatform owns it; it must outlive
-// the fakes.
+// Records the order in which calls reach all the fakes. Tests use it to check the order of steps
+// that go to different services. Any thread may record. FakePlatform owns it; it must outlive the
+// fakes.
 class Journal {
  public:
   void record(JournalKind kind, std::string_view text);

@@ -26,7 +26,7 @@ class LinuxPlatform {
   ~LinuxPlatform();
 
   [[nodiscard]] Services services();
-  // Opens the store, then the socket, so that nothing is accepted that could not be kept.
+  // Opens the store, then the socket, so that everything that is accepted can be stored.
   // The services must be installed. The code of a failure is the exit status of the process.
   Result<void, int> open();
   // Ends the queues, writes what waits for the store, and logs the statistics. False when a job or

@@ -98,7 +98,7 @@ class KtraceContract : public ::testing::Test {
     ASSERT_TRUE(harness_.letRunUntil([&] { return seen.completions > 0; }));
     EXPECT_FALSE(seen.isElsewhere);
   }
-  // The whole life of another session. After it, nothing of an earlier one can be pending.
+  // The whole life of another session. After it, no job of an earlier session can be pending.
   void letLifePass() {
     Seen other;
     const auto session = create(other);

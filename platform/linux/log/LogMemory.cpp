@@ -42,8 +42,8 @@ LogMemory::Contents LogMemory::contents() const {
   std::vector<Line> lines;
   std::string ring;
   Contents contents;
-  // Room for the largest contents, made before the lock: threads that log must not wait for an
-  // allocation.
+  // Reserve room for the largest contents before taking the lock: threads that log must not wait
+  // for an allocation.
   lines.reserve(bounds_.lines);
   ring.reserve(bounds_.bytes);
   {

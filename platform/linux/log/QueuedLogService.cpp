@@ -34,7 +34,7 @@ class QueuedLogService::Category final : public LogCategory {
       service_.memory_->add(entry, start);
     }
     if (level < service_.levels_.written) return;
-    // Copied only now: a line that is not written needs no text.
+    // Copy the text only now: a line that is not written needs none.
     entry.text = start;
     service_.add(std::move(entry));
   }

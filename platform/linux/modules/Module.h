@@ -12,11 +12,11 @@ namespace halvox::platform::linux_ {
 struct Module {
   const char* file;  // such as "halvox-link-nats.so"
   // The function that makes the part. Its name ends with the version of its signature and of the
-  // classes that it shares with the program: raise it with each change of them.
+  // classes that it shares with the program: raise it whenever one of these changes.
   const char* entryPoint;
 };
 
-// Where the module is: beside the program, as in a build, else where it is installed.
+// Where the module is: beside the program, as in a build tree, or else where it is installed.
 [[nodiscard]] std::filesystem::path modulePath(const Module& module);
 
 // Loads the module and returns the address of its entry point, or why it cannot be loaded. The

@@ -92,7 +92,7 @@ std::uint32_t readXruns(const spa_pod& value) {
 }
 
 std::optional<ProfiledCycle> readCycle(const spa_pod* pod) {
-  // The macros of the library take no pointer to const. Nothing is changed.
+  // The macros of the library take no pointer to const. They do not change the object.
   auto* object = reinterpret_cast<spa_pod_object*>(const_cast<spa_pod*>(pod));
   ProfiledCycle cycle;
   bool hasClock = false;

@@ -13,7 +13,7 @@ namespace {
 
 using std::chrono::nanoseconds;
 
-// Events of the profiler, put together as the server does.
+// Events of the profiler, built in the same way as the server builds them.
 class ProfileDecoderTest : public testing::Test {
  protected:
   struct Follower {

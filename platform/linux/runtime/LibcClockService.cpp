@@ -39,7 +39,7 @@ Date LibcClockService::currentDate() const {
 }
 
 LocalTime LibcClockService::localTime(Date date) const {
-  constexpr double kFarthest = 1e15;  // some 31 million years, which time_t and tm can represent
+  constexpr double kFarthest = 1e15;  // about 31 million years, which time_t and tm can represent
   // The condition is negated so that NaN is refused, too.
   if (!(std::abs(date.secondsSince1970) <= kFarthest)) return {};
   // Round down and not towards zero, which gives another second before 1970.

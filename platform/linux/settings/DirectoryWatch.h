@@ -31,9 +31,9 @@ class DirectoryWatch {
   using OnChange = std::function<void(std::size_t directory, std::string_view file, Change change)>;
   enum class State : unsigned char { kArmed, kMustBeArmedAgain };
 
-  // Starts to watch these directories (absolute paths) instead of those before. Changes between the
-  // last read() and this call are lost: compare the files afterwards. Returns the first error for a
-  // directory that exists but cannot be watched.
+  // Starts to watch these directories (absolute paths) instead of the previous ones. Changes
+  // between the last read() and this call are lost: compare the files afterwards. Returns the first
+  // error for a directory that exists but cannot be watched.
   [[nodiscard]] std::error_code arm(std::vector<std::filesystem::path> directories);
   // Returns true when the directory existed at the last arm().
   [[nodiscard]] bool isThere(std::size_t directory) const { return isThere_[directory]; }
@@ -49,7 +49,7 @@ class DirectoryWatch {
 
  private:
   struct Watch {
-    std::vector<std::size_t> directories;        // indices of the directories that this one is
+    std::vector<std::size_t> directories;        // indices of this directory in the list
     std::set<std::string, std::less<>> awaited;  // missing names on the way to a directory
   };
 

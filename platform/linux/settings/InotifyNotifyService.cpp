@@ -95,7 +95,7 @@ void InotifyNotifyService::stop() {
   {
     const MutexLock held(mutex_);
     isStopping_ = true;
-    // Joined without the lock, which the thread takes to adopt registrations.
+    // Join without the lock, which the thread takes to adopt registrations.
     ending.swap(thread_);
     if (wake_) static_cast<void>(::eventfd_write(wake_.get(), 1));
   }

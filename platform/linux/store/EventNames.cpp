@@ -35,8 +35,8 @@ EventName* EventNames::find(std::string_view name) {
       }
       // Another thread set the slot first. Its entry is now in `present` and may have this name.
     }
-    // The next slot, until the name or an empty one is found. An empty slot proves that the name is
-    // not in the table, because entries are never removed.
+    // Try the next slot, until the name or an empty slot is found. An empty slot proves that the
+    // name is not in the table, because entries are never removed.
     if (present->text == name) return present;
     index = (index + 1) % kSlots;
   }

@@ -68,7 +68,7 @@ TextKind classify(std::string_view text) {
 std::string_view dateText(double secondsSince1970, std::span<char, 64> buffer) {
   using namespace std::chrono;
   // A date just before the end would be rounded up to the year 10000.
-  // Rounded, because a fraction such as .1 is often a little less as a double.
+  // Round, because a fraction such as .1 is often a little less as a double.
   const auto rounded = microseconds{std::llround(secondsSince1970 * 1e6)};
   const sys_time<microseconds> time{
       std::min(rounded, duration_cast<microseconds>(duration<double>(kEnd)) - microseconds(1))};

@@ -81,7 +81,7 @@ SqliteCode RecordSpans::note(double time) {
     span_.lastTime = std::max(span_.lastTime, time);
     return SQLITE_OK;
   }
-  // The first record of the next span: the times of the last one are complete.
+  // This is the first record of the next span: the times of the previous span are complete.
   const SqliteCode code = flush();
   span_ = {number, time, time};
   return code;

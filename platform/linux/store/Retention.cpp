@@ -102,7 +102,7 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
   }
   // The file becomes shorter only when the log is copied into it.
   const bool hasShrunk = fileBytes() < before;
-  // Once, at the end of a series of steps.
+  // Copy the log only once, at the end of a series of steps.
   return hasShrunk && !more ? statements_.checkpoint.run() : SQLITE_OK;
 }
 

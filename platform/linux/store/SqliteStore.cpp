@@ -187,7 +187,7 @@ Result<std::string, StoreError> SqliteStore::beginAnew(const std::string& findin
 // Begins a new database. Copies the records of this run, which are newer than `extent_`, into it.
 // Those of earlier runs are only in the renamed file.
 void SqliteStore::replaceDamaged(const std::string& finding) {
-  // A copy, because useDatabase() below reads that of the new database.
+  // Copy the extent, because useDatabase() below replaces it with that of the new database.
   const StoreExtent extent = extent_;
   const auto newName = beginAnew(finding);
   if (!newName) return kLog.error("", newName.error().message);

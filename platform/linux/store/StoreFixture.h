@@ -35,7 +35,7 @@ class StoreFixture : public ::testing::Test {
 
   // Makes a store with `options` and opens it.
   Result<void, StoreError> open();
-  // The same; fails the test on an error.
+  // Opens the store; fails the test on an error.
   void start() {
     const auto opened = open();
     ASSERT_TRUE(opened) << "cannot open the store: " << opened.error().message;

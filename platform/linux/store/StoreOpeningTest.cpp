@@ -15,7 +15,7 @@ using ::testing::SizeIs;
 
 class StoreOpeningTest : public StoreFixture {
  protected:
-  // Makes a store with 4,000 events and closes it in good order.
+  // Makes a store with 4,000 events and closes it properly.
   void makeStore() {
     start();
     for (std::int64_t number = 0; number < 4000; ++number) send(number);

@@ -13,8 +13,8 @@ namespace halvox::platform::linux_ {
 //   {"product": "HVReporting", "version": 4, "unit": "ns", "values": {"IOStart": [1250, 1310]}}
 //
 // Names are in the order of their first values, and the values of a name in the order in which they
-// came. A number is written with enough digits that reading it gives the same double. NaN and the
-// infinities, which JSON does not have, are null.
+// were added. A number is written with enough digits that reading it gives the same double. NaN and
+// the infinities, which JSON does not have, are null.
 //
 // A file appears under its name, and replaces an older one, when it is complete and on the disk. No
 // symbolic link below the root is followed.

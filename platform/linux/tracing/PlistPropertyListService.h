@@ -20,8 +20,8 @@ class PlistPropertyListService final : public PropertyListService {
   // Errors name the path and the system's reason.
   [[nodiscard]] std::optional<Data> readFile(std::string_view path,
                                              std::optional<Error>& error) const override;
-  // Keys and texts that are not UTF-8 have the wrong bytes replaced. A unique identifier becomes
-  // its number.
+  // In keys and texts, bytes that are not UTF-8 are replaced. A unique identifier becomes its
+  // number.
   [[nodiscard]] std::optional<Value> parse(const std::optional<Data>& bytes,
                                            std::optional<Error>& error) const override;
 };

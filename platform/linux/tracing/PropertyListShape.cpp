@@ -35,9 +35,10 @@ bool hasNulInXml(std::string_view text) {
 // Counts the tags of an XML list and compares them with the bounds.
 //
 // This is not an XML parser, and must not be: it only has to count at least as much as the library
-// will. Whatever the library might read differently is refused or counted against the file. Opening
-// tags inside comments count, closing ones do not; quotes in tags must be balanced and contain no
-// bracket; the document type must not have declarations of its own.
+// will. Anything that the library might read differently is refused, or counted in the way that
+// reaches the bounds sooner. Opening tags inside comments count, closing ones do not; quotes in
+// tags must be balanced and contain no bracket; the document type must not have declarations of its
+// own.
 class XmlShape {
  public:
   XmlShape(std::string_view text, const PropertyListBounds& bounds)

@@ -26,7 +26,7 @@ void CallbackThread::stop() {
   {
     const MutexLock lock(mutex_);
     isStopped_ = true;
-    // Joined without the lock, which the thread needs to end.
+    // Join without the lock, which the thread needs in order to end.
     last = std::move(thread_);
   }
   if (last.joinable()) last.join();

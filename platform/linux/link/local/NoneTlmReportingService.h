@@ -7,8 +7,8 @@ namespace halvox::platform::linux_ {
 
 // The real-time reporting framework of a service whose link is disabled: no discovery finds a
 // back-end, and every message is counted and refused.
-// Threads: any may call; nothing blocks. Owner: the platform, which also owns the objects of the
-// constructor; they must outlive this one.
+// Threads: any may call; nothing blocks. Owner: the platform, which also owns the constructor's
+// arguments; these must outlive this object.
 class NoneTlmReportingService final : public ServerlessTlmReportingService {
  public:
   // Discoveries are answered on the thread of `callbacks`.

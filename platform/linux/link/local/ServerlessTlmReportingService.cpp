@@ -60,7 +60,7 @@ TLMReportingService::Session ServerlessTlmReportingService::TLMReportingCreateSe
 
 void ServerlessTlmReportingService::TLMReportingStartConfiguration(const Session& /*session*/,
                                                                    BackendsCallback found) {
-  // On another thread: the port promises that `found` is not called inside this call.
+  // Answer on another thread: the port promises that `found` is not called inside this call.
   callbacks_.call([found = std::move(found), backends = backends_] { found(backends); });
 }
 

@@ -47,8 +47,7 @@ AckLedger::FlushId AckLedger::flush(Done done) {
   Account account;
   {
     const MutexLock lock(mutex_);
-    // Messages that are sent from now on belong to the next flush: this one must end although
-    // others follow.
+    // Later messages belong to the next flush: this one must end although others follow.
     account = std::exchange(current_, Account{});
     current_.first = account.last + 1;
     current_.last = account.last;

@@ -40,7 +40,7 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
   {
     const MutexLock lock(mutex_);
     const bool isRefused = closeBy_.has_value();
-    // The thread is made by the first session that asks: a service without sessions needs no link.
+    // The first session that calls starts the thread: a service without sessions needs no link.
     if (!isRefused) failure = provideThread();
     if (!isRefused && failure.empty()) {
       wakeThread();
@@ -150,7 +150,7 @@ bool NatsLink::close() {
   return true;
 }
 
-// False if the thread still works at leaveBy_. The thread itself moves that time: to a later one
+// False if the thread still runs at leaveBy_. The thread itself moves that time: to a later one
 // before work that ends within known limits, and to an earlier one before work that may hang.
 bool NatsLink::awaitThread() {
   {

@@ -71,7 +71,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   [[nodiscard]] std::optional<Error> send(OutgoingMessage message) HALVOX_EXCLUDES(mutex_);
   // Publishes queued messages for at most kCloseTime, then ends the connection and the library.
   // Returns false if the thread still runs: this object then exists until the process ends, and
-  // `environment` must, too. Further calls return the same.
+  // `environment` must, too. Further calls return the same result.
   [[nodiscard]] bool close() HALVOX_EXCLUDES(mutex_);
 
  private:

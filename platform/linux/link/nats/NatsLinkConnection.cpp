@@ -232,7 +232,7 @@ void NatsLink::onAvailable(natsConnection* connection) {
   const std::int64_t maxPayload = natsConnection_GetMaxPayload(connection);
   const bool isConnected = natsConnection_Status(connection) == NATS_CONN_STATUS_CONNECTED;
   const MutexLock lock(mutex_);
-  // The library reports on threads of its own, possibly late: the connection may have been replaced
+  // The library calls back on its own threads, possibly late: the connection may have been replaced
   // or closed since.
   if (connection != connection_.get() || !isConnected || state_ == State::kLost) return;
   state_ = State::kConnected;

@@ -13,8 +13,8 @@ constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
 constexpr std::string_view kErrorDomain = "com.tarno.halvox.link";
 
-// Messages taken from the queue under one hold of the lock. The library is called without the
-// lock; senders would otherwise wait while it writes.
+// How many messages are taken from the queue each time that the lock is held. The library is called
+// without the lock; senders would otherwise wait while it writes.
 constexpr std::size_t kMessagesAtOnce = 64;
 
 // A message without an acknowledgement in this time counts as lost. The time is much longer than a
@@ -354,7 +354,7 @@ void NatsPublisher::settle(const PendingAcks::Entry& entry, const jsPubAckErr* e
   } else {
     const std::string_view reason = natsStatus_GetText(error->Err);
     countFailure(1, error->ErrText != nullptr ? error->ErrText : reason);
-    // Looked up by name: there are many reasons, and failures are rare.
+    // Look the counter up by name: there are many reasons, and failures are rare.
     statistics_.counter(kNatsPiece, std::string("failed: ") + std::string(reason)).add();
   }
   if (!entry.ledger) return;

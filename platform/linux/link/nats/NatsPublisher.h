@@ -52,8 +52,9 @@ struct OutgoingMessage {
 // files. The publisher then creates the stream again. A message without an acknowledgement within
 // kAckTime of its first attempt is abandoned and counted as not acknowledged.
 //
-// Threads: any, except for the functions marked "link's thread only". A thread of the library calls
-// onAcknowledged(). Only the link's thread ever waits for a server.
+// Threads: any, except for the functions from attach() to detach(), which are for the link's
+// thread. A thread of the library calls onAcknowledged(). Only the link's thread ever waits for a
+// server.
 // Locks: `wake` may lock the owner, and is called with no lock of this class held. The owner may
 // hold its own lock when it calls a function, unless the function is for the link's thread only.
 // Owner: NatsLink, which keeps the publisher until the library has ended.

@@ -41,7 +41,7 @@ std::optional<PendingAcks::Entry> PendingAcks::take(const natsMsg* message) {
   if (found == atLibrary_.end()) return std::nullopt;
   const std::uint64_t number = found->second;
   atLibrary_.erase(found);
-  // Abandoned as overdue while the library had it. Its slot no longer exists.
+  // The message was abandoned as overdue while the library had it. Its slot no longer exists.
   if (number < first_) return std::nullopt;
   Entry entry = settle(slots_[number - first_]);
   skipSettled();
@@ -68,7 +68,7 @@ NatsMessage PendingAcks::nextAgain() {
 
 std::vector<PendingAcks::Entry> PendingAcks::takeOverdue(Time now) {
   std::vector<Entry> overdue;
-  // Looks at the oldest only: deadlines are given in the order of the numbers.
+  // Only the oldest is checked: a later message never has an earlier deadline.
   while (!slots_.empty() && slots_.front().entry.deadline <= now) {
     overdue.push_back(settle(slots_.front()));
     skipSettled();

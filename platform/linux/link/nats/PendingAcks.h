@@ -63,9 +63,11 @@ class PendingAcks {
   void beginAgain() { again_ = first_; }
   // Whether messages must be published again before anything new.
   [[nodiscard]] bool needsAgain() const { return again_ < first_ + slots_.size(); }
-  // Whether the next of them is held here. If it is not, the library will report about it.
+  // Whether the next message to publish again is held here. If it is not, the library will report
+  // about it.
   [[nodiscard]] bool hasAgain() const { return needsAgain() && slots_[again_ - first_].held; }
-  // Removes and returns the next of them, to be published at once. Call only if hasAgain().
+  // Removes and returns the next message to publish again. Publish it at once. Call only if
+  // hasAgain().
   NatsMessage nextAgain();
 
   // Removes and returns the messages whose deadline has passed, oldest first.

@@ -98,8 +98,8 @@ Result<void, StoreError> EventFollower::deliverBy(Read read) {
 }
 
 // Opens the database that replaced the old one; its record IDs start from 1. Returns false while
-// there is none. A database that is still being created can fail in any way, so an error counts
-// only after the last look.
+// there is none. A database that is still being created can fail in any way. An error therefore
+// counts only at the last attempt.
 Result<bool, StoreError> EventFollower::reopen() {
   auto opened = reader_.open(directory_);
   if (opened) {

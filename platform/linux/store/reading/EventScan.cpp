@@ -68,7 +68,7 @@ SqliteCode EventScan::next(Piece& piece) {
       Event event{};
       if (!readEvent(read_, which, event)) continue;
       if (!hasPayload) {
-        // Copied once for both events of a record.
+        // Copy the payload once for both events of a record.
         piece.payloads.emplace_back(read_.text(kPayload));
         bytes += piece.payloads.back().size();
         hasPayload = true;

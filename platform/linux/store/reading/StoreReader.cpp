@@ -89,10 +89,10 @@ SqliteCode StoreReader::openFile() {
   };
   const std::string& path = files_->database().native();
   const SqliteCode code = attempt(path);
-  // Reading a WAL database takes its -shm file, which a user who may only read cannot create. Such
-  // a user can still read a database that was closed in good order: without a log, the file alone
-  // is complete.
-  // The low byte is the code itself; the other bits say more about it.
+  // Reading a WAL database needs its -shm file, which a user who may only read cannot create. Such
+  // a user can still read a database that was closed properly: without a log, the file alone is
+  // complete.
+  // The low byte is the primary code; the other bits give details.
   const bool needsLog = (code & 0xFF) == SQLITE_CANTOPEN || (code & 0xFF) == SQLITE_READONLY;
   return needsLog && files_->logBytes() == 0 ? attempt(immutableURI(path)) : code;
 }

@@ -88,7 +88,7 @@ struct LttngPerformanceTraceService::Work {
 
   // Sets the URL of the trace, or returns why there is none.
   std::optional<Error> save(const LttngControl::Recording& recording, std::string& url) {
-    // The number keeps traces of one second apart.
+    // The number distinguishes traces of the same second.
     const std::string name = kTraceStart + timeText() + "-" + std::to_string(++saves) + kTraceEnd;
     const std::filesystem::path archive = control.tracesDirectory() / name;
     const auto packed = packDirectory(recording.directory, archive);

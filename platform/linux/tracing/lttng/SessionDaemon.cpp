@@ -9,7 +9,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The interval of polling: the library has no call that waits for the daemon.
+// The polling interval: the library has no call that waits for the daemon.
 constexpr std::chrono::milliseconds kLookEvery{10};
 
 }  // namespace

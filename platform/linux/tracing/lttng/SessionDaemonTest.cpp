@@ -87,7 +87,7 @@ class SessionDaemonTest : public testing::Test {
     std::ofstream(note_) << process << ' ' << startTimeOf(process) << '\n';
     daemon_.adopt(kOwnSessions);
   }
-  // A process of ours that waits until it is ended.
+  // A child process that waits until a signal ends it.
   static pid_t startSleeper() {
     const pid_t child = ::fork();
     if (child == 0) {

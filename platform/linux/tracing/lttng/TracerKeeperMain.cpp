@@ -115,7 +115,7 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
   // the daemon.
   say(std::to_string(daemon->pid) + " " + daemon->startTime);
   awaitEndOfService();
-  // The note stays: the next service finds its daemon by it and gives it a keeper.
+  // The note stays: the next service finds the daemon through it and gives the daemon a keeper.
   if (daemon->isAlive() && isUsedByOthers(*daemon, ownSessions)) return EXIT_SUCCESS;
   daemon->end(kEndsWithin);
   std::filesystem::remove(noteFile, ignored);
