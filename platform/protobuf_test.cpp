@@ -126,7 +126,7 @@ TEST(ProtoReaderTest, AGroupEndsOnlyWithItsOwnNumber) {
 
 TEST(ProtoReaderTest, GroupsAreSkippedToADepthOfOneHundred) {
   const auto nested = [](std::size_t depth) {
-    Bytes bytes(depth - 1, 0x4B);  // the tag of the outermost one is read already
+    Bytes bytes(depth - 1, 0x4B);  // the tag of the outermost group has been read already
     bytes.insert(bytes.end(), depth, 0x4C);
     return bytes;
   };

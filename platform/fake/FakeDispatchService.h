@@ -134,11 +134,11 @@ class FakeDispatchService final : public DispatchService {
   void add(std::shared_ptr<FakeDispatchQueue> queue, JobWeight weight, Job job);
   void beginWait(Wait wait);
   void signal(FakeDispatchSemaphore& semaphore);
-  // Under the mutex.
+  // The caller holds the mutex.
   void addSignal(FakeDispatchSemaphore& semaphore);
   [[nodiscard]] bool tryTakeSignal(FakeDispatchSemaphore& semaphore);
   void setWaiting(FakeDispatchQueue* queue, bool isWaiting);
-  // Under the mutex: lets the queue continue with `then`, ahead of its other jobs.
+  // The caller holds the mutex. Lets the queue continue with `then`, ahead of its other jobs.
   void endWait(Wait wait, WaitOutcome outcome);
   [[nodiscard]] Waits::iterator firstToTimeOut();
   bool passNext(std::chrono::nanoseconds until);

@@ -10,7 +10,7 @@ namespace halvox::platform {
 namespace {
 
 constexpr std::uint64_t kNanosecondsAtTickZero = 1'000'003;
-constexpr int kUnsuitable = 1;  // a call that does not suit the session's state
+constexpr int kUnsuitable = 1;  // a call that is not allowed in the session's state
 
 std::string hexadecimal(std::uint32_t number) {
   std::array<char, 16> text;

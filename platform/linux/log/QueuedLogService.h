@@ -71,7 +71,7 @@ class QueuedLogService final : public LogService {
   Counter& dropped_;
   Counter& failed_;
   LogQueue queue_;
-  // Lost lines that no log line has reported yet. Orders nothing: it is only a number.
+  // Lost lines that no log line has reported yet. Orders no other memory.
   std::atomic<std::uint64_t> unreported_{0};
   Mutex mutex_;
   std::map<std::pair<std::string, std::string>, std::unique_ptr<Category>> categories_

@@ -20,7 +20,7 @@ class LibcClockService final : public ClockService {
   [[nodiscard]] std::chrono::milliseconds processUptime() const override;
 
  private:
-  const std::chrono::nanoseconds processStart_;  // after the start of the system
+  const std::chrono::nanoseconds processStart_;  // measured from the start of the system
 };
 
 }  // namespace halvox::platform::linux_

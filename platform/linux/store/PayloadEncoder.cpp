@@ -67,7 +67,7 @@ TextKind classify(std::string_view text) {
 // Writes a date as "2023-11-14T22:13:20.250000Z" into `buffer`.
 std::string_view dateText(double secondsSince1970, std::span<char, 64> buffer) {
   using namespace std::chrono;
-  // A date just before the end would be rounded up to the year 10000.
+  // Limit the result: a date just before the end would be rounded up to the year 10000.
   // Round, because a fraction such as .1 is often a little less as a double.
   const auto rounded = microseconds{std::llround(secondsSince1970 * 1e6)};
   const sys_time<microseconds> time{

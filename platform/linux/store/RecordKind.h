@@ -71,8 +71,8 @@ class RecordKind {
   // yet written, counts them under the reason and adds them to `finished`. Returns their number.
   virtual std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) = 0;
 
-  // Returns the time of the oldest record (seconds since 1970) in `time`, or std::nullopt without
-  // one.
+  // Sets `time` to the time of the oldest record (seconds since 1970), or to std::nullopt if there
+  // is no record.
   [[nodiscard]] virtual SqliteCode oldestTime(std::optional<double>& time) = 0;
 
   // Delete a few records in the open transaction: the oldest, or those older than `time` (seconds

@@ -21,7 +21,7 @@ constexpr std::uint64_t kCacheKibibytes = 1024;
 constexpr std::uint64_t kLargestLog = 4 * kMegabyte;
 // A record becomes visible with the commit of its transaction. This bounds the time until then.
 constexpr std::uint64_t kLargestTransaction = 2 * kMegabyte;
-// Below the 1,000,000,000 bytes that SQLite accepts for one value.
+// Must stay below the 1,000,000,000 bytes that SQLite accepts for one value.
 constexpr std::uint64_t kLargestPayload = 256 * kMegabyte;
 // How long the writer waits for a lock of another process before it drops the records being
 // written. Half of the half second within which a stored record must be visible.

@@ -49,7 +49,7 @@ class ServerlessTlmReportingService : public TLMReportingService {
   const std::string name_;
   const std::optional<Array> backends_;
   CallbackThread& callbacks_;
-  std::atomic<std::uint64_t> lastToken_{0};  // orders nothing; only unique
+  std::atomic<std::uint64_t> lastToken_{0};  // orders no other memory; only makes tokens unique
 };
 
 }  // namespace halvox::platform::linux_

@@ -108,7 +108,7 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
   {
     const MutexLock lock(mutex_);
     error = refusal(message.bytes);
-    // Take it under this lock: after close() has begun, no message must enter the queue, because it
+    // Take it under this lock: after close() has begun, no message may enter the queue, because it
     // would not be counted.
     if (!error) error = publisher_.take(message);
     if (!error) {

@@ -48,7 +48,7 @@ class NatsTlmReportingService final : public NatsTlmReporting {
   const std::string subject_;
   const std::string instance_;  // random, unique to this run of the service
   DispatchService& dispatch_;
-  std::atomic<std::uint64_t> lastToken_{0};  // orders nothing; neither does the next
+  std::atomic<std::uint64_t> lastToken_{0};  // orders no other memory; nor does the next
   std::atomic<std::uint64_t> lastMessage_{0};
   const std::shared_ptr<NatsLink> link_;  // shared with delayed jobs of the link
 };

@@ -37,7 +37,7 @@ SqliteCode EventScan::skipToNewest(std::uint64_t count) {
   StoredRecordID begin = 2 * (bounds_.last + 1);
   std::uint64_t found = 0;
   while (found < count && (code = statement.step()) == SQLITE_ROW) {
-    // The twin first, because this reads from the newest event back.
+    // Read the twin first, because this loop reads from the newest event back.
     for (const int which : {1, 0}) {
       Event event{};
       if (found >= count || !readEvent(statement, which, event)) continue;

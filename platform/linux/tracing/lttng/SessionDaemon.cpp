@@ -20,8 +20,8 @@ bool SessionDaemon::isNoted() const {
 }
 
 void SessionDaemon::adopt(const std::string& ownSessions) {
-  // The keeper of the last run may be ending its daemon just now. Adopting it would fail a moment
-  // later.
+  // The keeper of the last run may be ending its daemon now. An adopted daemon would then end a
+  // moment later.
   TracerKeeper::awaitEarlier(noteFile_, keeperEndsWithin());
   ownSessions_ = ownSessions;
   auto noted = DaemonProcess::read(noteFile_);
