@@ -11,7 +11,7 @@ using platform::linux_::MutexLock;
 
 // Enough to keep the service busy; few enough that the outcome of a message is known soon.
 constexpr std::size_t kMaxOpenCalls = 256;
-// The same in bytes. A single larger message is allowed.
+// The same limit in bytes. A single larger message is allowed.
 constexpr std::size_t kMaxOpenBytes = std::size_t{4} << 20U;
 // A full window opens again when half of it is answered: fewer and larger writes.
 constexpr std::size_t kReopenAtCalls = kMaxOpenCalls / 2;

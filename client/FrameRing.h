@@ -102,11 +102,11 @@ class FrameRing {
   // popped and pushed between another thread's load and exchange. Acquire and release order the
   // consumer's reading of a cell before its reuse.
   alignas(64) std::atomic<std::uint64_t> free_{0};
-  // Cells from here on have never been used.
+  // All cells from this one on have never been used.
   alignas(64) std::atomic<CellNumber> fresh_{0};
   alignas(64) std::atomic<std::uint64_t> tail_{0};
-  // Positions below have been released. Acquire and release order the emptying of a slot before its
-  // reuse.
+  // All positions below this one have been released. Acquire and release order the emptying of a
+  // slot before its reuse.
   alignas(64) std::atomic<std::uint64_t> released_{0};
   alignas(64) std::uint64_t head_ = 0;
   Chain taken_;

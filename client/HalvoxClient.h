@@ -19,8 +19,8 @@ using platform::Value;
 
 // The number of a session, chosen by the program that creates it. 0 means no session.
 using ReporterID = std::int64_t;
-// What client/Vocabulary.h names: what a message is about, what happened, and what kind of audio a
-// session is for.
+// client/Vocabulary.h names their values: what a message is about, what happened, and what kind of
+// audio a session is for.
 using Category = std::uint32_t;
 using EventType = std::uint16_t;
 using ServiceType = std::uint16_t;
@@ -125,8 +125,8 @@ class HalvoxClient {
   // Hands over one message for a session. The session may belong to another client. Returns false
   // if the message was dropped; see counters().
   bool send(ReporterID id, const Dictionary& message, Category category, EventType type);
-  // The same for several sessions. Without a list, the message is for all started sessions of all
-  // programs.
+  // Hands over one message for several sessions. Without a list, the message is for all started
+  // sessions of all programs.
   bool send(const std::optional<std::vector<ReporterID>>& ids, const Dictionary& message,
             Category category, EventType type);
   bool sendTo(std::span<const ReporterID> ids, const Dictionary& message, Category category,

@@ -22,7 +22,7 @@ using platform::linux_::UniqueHandle;
 using Bus = UniqueHandle<sd_bus*, sd_bus_close_unref>;
 using BusMessage = UniqueHandle<sd_bus_message*, sd_bus_message_unref>;
 
-// sd-bus as a server, which reads what the encoder makes.
+// A fixture in which sd-bus, as a server, reads the frames of the encoder.
 class RequestEncoderTest : public testing::Test {
  protected:
   RequestEncoderTest() {

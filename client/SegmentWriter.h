@@ -15,7 +15,7 @@ struct Segment {
   char* end = nullptr;
 };
 
-// Where a SegmentWriter gets its memory from. The caller owns it.
+// Provides the memory of a SegmentWriter. The caller owns the source.
 class SegmentSource {
  public:
   SegmentSource() = default;

@@ -46,7 +46,8 @@ class ServiceStream {
   // Ends the connection from this side, without closing the socket yet.
   void end() { ended_ = true; }
 
-  // What has been received and not consumed. Begins with a frame once the handshake is done.
+  // Returns the bytes that were received and not yet consumed. They begin with a frame once the
+  // handshake is done.
   [[nodiscard]] std::span<const std::byte> input() const;
   void consume(std::size_t bytes) { consumed_ += bytes; }
 
@@ -76,14 +77,14 @@ struct ConnectedStream {
 // the search. The failure names the places that were tried.
 std::variant<ConnectedStream, Failure> connectToService(const std::vector<std::string>& places);
 
-// What the header of an answer says.
+// The header of an answer.
 struct Answer {
   std::uint32_t replySerial = 0;
   bool isError = false;
   std::span<const std::byte> frame;
 };
 
-// What the input begins with.
+// The first frame of the input.
 struct NextFrame {
   enum class State : std::uint8_t {
     kIncomplete,  // wait for more bytes

@@ -113,7 +113,8 @@ inline char* putNumber(char* at, const Value& value) {
 
 // Signature, padding and number need at most this much, including what padded() writes.
 constexpr std::size_t kNumberRoom = 24;
-// The same for an entry besides its texts: padding, two lengths, two NULs and a signature.
+// The room that an entry needs in addition to its texts: padding, two lengths, two NULs and a
+// signature.
 constexpr std::size_t kEntryRoom = 16 + kNumberRoom;
 
 // Appends values and remembers why one cannot be sent. If `path` is not null, stores the place of

@@ -15,7 +15,7 @@ namespace halvox::platform::linux_ {
 
 // A program to start as a child process, without a shell.
 struct ChildProgram {
-  // What the child has as descriptor `number`: this process's `ours`, or /dev/null.
+  // The child's descriptor `number` is a copy of this process's `ours`, or /dev/null.
   struct Descriptor {
     static constexpr int kNull = -1;
     int number;
@@ -26,8 +26,8 @@ struct ChildProgram {
     kWithoutCloseOnExec,  // those without the close-on-exec flag, including the standard streams
     kClosed               // none above the largest number in `descriptors`
   };
-  // What the child is a member of. A group of its own lets one signal reach all that it starts. A
-  // session of its own also keeps the signals of our terminal away from it.
+  // The process group and session of the child. With a group of its own, one signal reaches all
+  // processes that it starts. With a session of its own, it also gets no signals of our terminal.
   enum class Group : std::uint8_t { kOurs, kOwnGroup, kOwnSession };
   // Threads of this program block all signals, and the program ignores some. A child that inherits
   // this may not end when it should. Use kInherited only to pass on the settings with which this

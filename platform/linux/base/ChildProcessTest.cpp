@@ -196,7 +196,7 @@ class Signals {
     ::pthread_sigmask(SIG_SETMASK, &mask_, nullptr);
     std::signal(SIGPIPE, before_);
   }
-  // Whether the line of /proc/self/status has the signal.
+  // Returns whether that line of /proc/self/status has the signal.
   static bool has(const std::string& status, const std::string& name, int signal) {
     const std::size_t at = status.find(name + ":");
     return (std::stoull(status.substr(at + name.size() + 1), nullptr, 16) >> (signal - 1) & 1U) !=

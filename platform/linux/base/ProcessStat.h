@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// What /proc/<pid>/stat says about a process. See proc(5).
+// Fields of /proc/<pid>/stat. See proc(5).
 struct ProcessStat {
   char state = '?';            // field 3: 'Z' has ended, but its parent has not waited for it
   std::uint64_t startTicks{};  // field 22: clock ticks from the start of the system to its start

@@ -32,8 +32,8 @@ bool isPlainByte(unsigned char byte) {
   return byte < 0x80 && (kNul == Nul::kAllowed || byte != 0);
 }
 
-// What may follow a lead byte. The bounds of the second byte exclude overlong forms, surrogates and
-// numbers above U+10FFFF.
+// The bytes that may follow a lead byte. The bounds of the second byte exclude overlong forms,
+// surrogates and numbers above U+10FFFF.
 struct Sequence {
   std::size_t length;
   unsigned char secondMin;
@@ -51,7 +51,7 @@ Sequence sequenceAfter(unsigned char lead) {
   return {0, 0, 0};
 }
 
-// Returns the length of the character of several bytes at the start of `text`; 0 if there is none.
+// Returns the length of the multi-byte character at the start of `text`; 0 if there is none.
 std::size_t multiByteLength(std::string_view text) {
   const auto byteAt = [text](std::size_t index) { return static_cast<unsigned char>(text[index]); };
   const Sequence sequence = sequenceAfter(byteAt(0));

@@ -29,7 +29,7 @@ struct FileToRead {
   Excess excess = Excess::kRefused;
 };
 
-// What was read, or why nothing was.
+// What was read, or why nothing could be read.
 struct FileContent {
   enum class Outcome : std::uint8_t {
     kRead,        // `bytes` is the whole file

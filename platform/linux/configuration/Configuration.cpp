@@ -269,8 +269,8 @@ Result<Configuration, ConfigurationError> parse(const std::string& file, std::st
   TableReader root(&parsed.table(), "", mistakes);
   readListener(root.table("listener"), configuration.listener);
   readStorage(root.table("storage"), configuration.storage);
-  // After the storage table, which names their parent directory, and before the tables that may
-  // replace them.
+  // Set them after the storage table, which names their parent directory, and before the tables
+  // that may replace them.
   setDefaultDirectories(configuration);
   readDirectory(root.table("preferences"), configuration.preferencesDirectory);
   readDirectory(root.table("notify"), configuration.notifyDirectory);
@@ -283,7 +283,8 @@ Result<Configuration, ConfigurationError> parse(const std::string& file, std::st
   configuration.device = root.table("device").readValues();
   readDrivers(root.table("drivers"), configuration.drivers);
   root.finish();
-  // After all tables: the first mistake in the text may be in the table that is read last.
+  // Check this after all tables: the first mistake in the text may be in the table that is read
+  // last.
   if (mistakes.first().has_value()) return *mistakes.first();
   return configuration;
 }

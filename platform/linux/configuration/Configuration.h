@@ -80,7 +80,7 @@ struct Configuration {
   Limits limits;
   Drivers drivers;
   std::filesystem::path preferencesDirectory;  // [preferences]: <directory>/<user>/<domain>.toml
-  std::filesystem::path notifyDirectory;       // [notify]: a file here posts by its name
+  std::filesystem::path notifyDirectory;       // [notify]: each file stands for a notification
   LogLevel logLevel = LogLevel::kDefault;
   // The lowest level of the lines that the log keeps in memory for captures of diagnostics.
   LogLevel logMemoryLevel = LogLevel::kInfo;

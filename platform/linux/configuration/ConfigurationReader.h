@@ -1,7 +1,7 @@
 #pragma once
 
 // Private to Configuration.cpp: reads the tables of a parsed file key by key. toml++ is included
-// here and not in Configuration.h, because it is large.
+// here and not in Configuration.h, because toml++ is large.
 
 #define TOML_HEADER_ONLY 0  // the parser is compiled once, in ConfigurationReader.cpp
 #define TOML_EXCEPTIONS 0

@@ -73,7 +73,7 @@ std::string busAddressOf(BusKind bus) {
         return address;
       }
       const std::string runtime = environment("XDG_RUNTIME_DIR");
-      // Where systemd's user manager puts the bus of a login, even if the variable is not set.
+      // systemd's user manager puts the bus of a login here even if the variable is not set.
       return runtime.empty() ? "" : "unix:path=" + runtime + "/bus";
     }
     case BusKind::kSystem: {

@@ -9,7 +9,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Where a Unix socket listens: a file, or a name in the abstract space.
+// The address of a Unix socket: a file, or a name in the abstract namespace.
 struct BusSocket {
   enum class Space : bool { kFile, kAbstract };
   Space space = Space::kFile;

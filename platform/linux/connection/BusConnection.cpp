@@ -177,7 +177,7 @@ void BusConnection::lose(const std::string& why) {
   kLog.error("lost the bus: ", why, "; disconnecting its ", senders_.size(),
              " clients and serving the socket only");
   stream_.setReading(false);
-  // A copy, because a sender that ends removes itself from the map.
+  // Iterate over a copy, because a sender that ends removes itself from the map.
   const auto senders = senders_;
   for (const auto& [name, sender] : senders) sender->onBusLost();
   questions_.clear();

@@ -162,7 +162,7 @@ Result<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::uint32
       input_.settle();
       continue;
     }
-    // A copy, because the frame of the result points into it and consuming changes the buffer.
+    // Copy the frame, because the result points into it and consuming changes the buffer.
     answer_.assign(next.bytes.begin(), next.bytes.end());
     input_.consume(next.totalBytes);
     std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(answer_);

@@ -53,7 +53,7 @@ class ConnectionHost final : public NSXPCListener {
   void resume() override;
   void requestStop() { inbox_->postStop(); }
 
-  // What connections work with.
+  // The parts that connections use.
   [[nodiscard]] const ConnectionOptions& options() const { return options_; }
   [[nodiscard]] const ServiceIdentity& identity() const { return identity_; }
   [[nodiscard]] Backpressure& backpressure() { return backpressure_; }

@@ -17,7 +17,7 @@ namespace halvox::platform::linux_ {
 // The I/O thread opens and waits; any thread closes. Owned by the client's link.
 class FlowControl {
  public:
-  // How much one request counts for.
+  // What one request adds to the number and the bytes of open requests.
   struct Cost {
     std::size_t requests = 1;
     std::size_t bytes = 0;

@@ -53,8 +53,8 @@ class FrameBuffer {
   FrameBuffer(const FrameBuffer&) = delete;
   FrameBuffer& operator=(const FrameBuffer&) = delete;
 
-  // Where the next read goes. Call received() after it, even if nothing arrived. Nothing else may
-  // use the scratch before settle().
+  // Returns the memory for the next read. Call received() after it, even if nothing arrived.
+  // Nothing else may use the scratch before settle().
   [[nodiscard]] std::span<std::byte> readInto(const ReadScratch& scratch);
   void received(std::size_t count);
   // Moves the remaining bytes out of the scratch, and frees storage that is not needed any more.
@@ -65,7 +65,8 @@ class FrameBuffer {
 
   // All unused bytes, whether or not they are a frame.
   [[nodiscard]] std::span<const std::byte> unused() const { return view_; }
-  // What comes next. Points into this buffer: valid until it is changed.
+  // Returns the next frame or part of one. It points into this buffer and is valid until the buffer
+  // is changed.
   [[nodiscard]] Next next() const;
   // Marks bytes as used. Those that have not arrived yet are dropped when they arrive.
   void consume(std::size_t count);

@@ -33,7 +33,7 @@ struct SocketAccess {
 
 // How connections are served.
 struct ConnectionOptions {
-  // Where the socket is. Not used under socket activation, which passes sockets.
+  // The path of the socket. Not used under socket activation, which passes sockets.
   std::filesystem::path socket;
   SocketAccess socketAccess;
   // Makes the directory of the socket if its parent exists.

@@ -14,7 +14,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Names from the wire have a valid form, but a path can be as long as the message.
+// Returns the name in quotes, cut if it is long. Names from the wire have a valid form, but a path
+// can be as long as the message.
 std::string quoted(std::string_view name) {
   constexpr std::size_t kMaxShown = 255;
   std::string text = "\"";

@@ -4,7 +4,7 @@
 #include "platform/linux/diagnostics/SnapshotFixture.h"
 #include "platform/linux/testing/FileSizeLimit.h"
 
-// What happens to snapshots when the disk refuses them.
+// Tests what happens to snapshots if the disk refuses them.
 
 namespace halvox::platform::linux_ {
 namespace {

@@ -9,7 +9,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Where to find facts about the system. Tests set paths of their own.
+// The places of facts about the system. Tests set paths of their own.
 struct SystemPaths {
   std::filesystem::path proc = "/proc";
   std::filesystem::path alsa = "/proc/asound";

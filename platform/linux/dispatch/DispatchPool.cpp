@@ -7,7 +7,8 @@ namespace halvox::platform::linux_ {
 
 DispatchPool::DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService& statistics)
     : runner_(std::move(runner)), labels_(statistics) {
-  // These threads watch the timer from the start. Those of other qualities are made when needed.
+  // The utility threads watch the timer from the start. Those of other qualities are made when they
+  // are needed.
   if (!utility_.provide()) {
     throw std::system_error(std::make_error_code(std::errc::resource_unavailable_try_again),
                             "cannot start the threads of the queues");

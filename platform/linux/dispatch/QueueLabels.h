@@ -11,7 +11,7 @@
 
 namespace halvox::platform::linux_ {
 
-// What the shared queues with one label have in common. It is how a stuck queue is found: its label
+// What the shared queues with one label have in common. It helps to find a stuck queue, whose label
 // counts more jobs added than run.
 struct QueueLabel {
   QueueLabel(Counter& addedJobs, Counter& ranJobs) : added(addedJobs), run(ranJobs) {}
@@ -31,7 +31,8 @@ class QueueLabels {
   // `statistics` must outlive this.
   explicit QueueLabels(StatisticsService& statistics) : statistics_(statistics) {}
 
-  // The label with that text, made at the first call. Valid as long as this object.
+  // Returns the label with that text. Makes it at the first call. Valid as long as this object
+  // exists.
   QueueLabel& label(std::string_view text) HALVOX_EXCLUDES(mutex_);
   // Returns the texts of the labels that have a queue with a turn.
   [[nodiscard]] std::vector<std::string> atWork() HALVOX_EXCLUDES(mutex_);

@@ -61,8 +61,9 @@ class ChannelList {
   std::size_t valueCount_ = 0;
 };
 
-// What one source has counted up to one moment. Signed numbers are kept as their two's complement.
-// Immutable after its source has made it; sessions share it from their start to their stop.
+// The values that one source has counted up to one moment. Signed numbers are kept as their two's
+// complement. Immutable after its source has made it; sessions share it from their start to their
+// stop.
 struct Reading {
   std::shared_ptr<const ChannelList> channels;
   std::vector<std::uint64_t> values;

@@ -58,7 +58,7 @@ class GroupChannels final : public IOReportChannels {
 
   [[nodiscard]] std::int32_t count() const { return static_cast<std::int32_t>(names_.size()); }
 
-  // The part of a source's reading that belongs to the set.
+  // Returns the part of a source's reading that belongs to the set.
   [[nodiscard]] DriverSamples::Part select(std::size_t source,
                                            std::shared_ptr<const Reading> reading) const {
     const MutexLock lock(mutex_);

@@ -198,7 +198,7 @@ TEST_F(LinuxIOReportServiceTest, AReadingThatWasBegunBeforeIsNotUsedAndTheNextOn
   std::jthread asker([&] { first = show(sample(found)); });
   readings.waitUntilBegun(before + 1);
 
-  // They make their requests during that reading and wait for the next one.
+  // The threads below make their requests during that reading and wait for the next one.
   const auto asked = [this] {
     return platform_.statistics.values("driver source made").at("readings asked for");
   };
@@ -267,7 +267,7 @@ TEST_F(LinuxIOReportServiceTest, ALateSourceThatComesRoundIsSampledAgain) {
   EXPECT_TRUE(eventually([&] { return show(sample(found)).size() == 1; }));
 }
 
-// Its counts start when its driver is loaded, not when the session starts.
+// The counts of a channel start when its driver is loaded, not when the session starts.
 TEST_F(LinuxIOReportServiceTest, WhatASourceThatWasLateAtTheSnapshotCountedIsNotReported) {
   longestWait_ = kShortWait;
   const auto channel = simpleChannel("Tx", "a");

@@ -50,7 +50,7 @@ SourceReader::Asked SourceReader::ask(std::chrono::milliseconds wait, Use use) {
   if (use == Use::kSample) isSampleWanted_ = true;
   const std::uint64_t number = want();
   received_.add();
-  // Read a late source too, to find out whether it is in time again.
+  // Do not wait for a late source. It is still read, to find out whether it is in time again.
   if (isLate_) return {};
   ++waiting_;
   return {.number = number, .isWaiting = true, .wait = wait, .deadline = Clock::now() + wait};

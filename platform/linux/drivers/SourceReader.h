@@ -55,7 +55,7 @@ class SourceReader {
     std::chrono::milliseconds wait{};
     Clock::time_point deadline{};
   };
-  // What a reading is for: which channels there are, or a sample of a session.
+  // The purpose of a reading: to find channels, or to sample them for a session.
   enum class Use : std::uint8_t { kFindChannels, kSample };
   // Requests a reading, which may take `wait`. Does not block: several sources can read at the same
   // time.
@@ -68,7 +68,8 @@ class SourceReader {
  private:
   using ReadingPointer = std::shared_ptr<const Reading>;
 
-  // Returns null if the reading is late. Sets `isFirstLate` if the source was in time before.
+  // Returns null if the reading is late. Sets `isFirstLate` if it is the first late reading in a
+  // row.
   [[nodiscard]] ReadingPointer receive(const Asked& asked, bool& isFirstLate);
   void run();
   void makeReadings() HALVOX_REQUIRES(mutex_);

@@ -59,7 +59,7 @@ class RawClient {
   bool awaitsHandshake_ = false;
 };
 
-// The same call, with the flag that no reply is expected.
+// Returns the same call with the flag that no reply is expected.
 std::string withoutReply(std::string call);
 
 }  // namespace halvox::platform::linux_

@@ -56,7 +56,7 @@ const NSXPCInterface& testInterface();
 inline constexpr const char* kTestPath = "/com/tarno/test/object";
 inline constexpr const char* kTestInterface = "com.tarno.test.Object";
 
-// Accepts every connection and exports one object, common to all, on it.
+// Accepts every connection, and exports the same object on all of them.
 class TestDelegate final : public NSXPCListenerDelegate {
  public:
   bool listenerShouldAcceptNewConnection(

@@ -63,7 +63,8 @@ class Decoder {
 
   WireReader reader_;
   DecodeScratch& scratch_;  // of the caller
-  // What went wrong. `path_` is where: each container adds its step while decoding leaves it.
+  // Describes the error. `path_` is its place: each container adds its step while decoding leaves
+  // it.
   bool failed_ = false;
   Kind kind_ = Kind::kMalformed;
   std::string_view problem_;
@@ -199,7 +200,7 @@ Value Decoder::decodeDictionary(std::string_view type, unsigned level) {
   if (!reader_.enterArray(8, outerLimit)) return malformed(type);
   const std::size_t first = scratch_.entries.size();
   while (!failed_ && !reader_.atLimit()) decodeEntry(type, level);
-  // What is left in the scratch is removed by decodeBody(), after an error as after a success.
+  // decodeBody() clears the scratch after an error and after a success.
   if (failed_) return {};
   reader_.leaveArray(outerLimit);
 
@@ -238,8 +239,8 @@ DecodeError Decoder::error() const {
   error.message = error.key + (error.key.empty() ? "" : ": ");
   error.message += problem_;
   error.message += " (signature \"" + error.signature + "\"";
-  // The path of an unsupported value is made of keys. For broken bytes, nothing but their place may
-  // be known.
+  // The path is enough to find an unsupported value. For broken bytes, their position may be all
+  // that is known.
   if (kind_ == Kind::kMalformed) {
     error.message += ", byte " + std::to_string(reader_.position()) + " of the body";
   }

@@ -67,7 +67,7 @@ struct DecodeScratch {
                                                     std::string_view expectedSignature,
                                                     std::vector<Value>& arguments,
                                                     DecodeScratch& scratch);
-// The same with a scratch of its own, for occasional messages.
+// Does the same with a scratch of its own, for occasional messages.
 [[nodiscard]] std::optional<DecodeError> decodeBody(const Frame& frame,
                                                     std::string_view expectedSignature,
                                                     std::vector<Value>& arguments);

@@ -35,7 +35,7 @@ class ValueEncoder {
       std::reverse(bytes, bytes + sizeof bytes);
     out_.append(bytes, sizeof bytes);
   }
-  // These two do not check the characters.
+  // These two functions do not check the characters.
   void appendText(std::string_view text);
   void appendSignature(std::string_view signature);
   // Overwrites a length that was appended as 0.

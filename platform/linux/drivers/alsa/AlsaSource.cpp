@@ -28,7 +28,7 @@ std::optional<unsigned> numberAfter(std::string_view name, std::string_view lett
 
 std::vector<std::string> namesIn(int directory) {
   std::vector<std::string> names;
-  // A copy, because closing the stream closes its descriptor too.
+  // Use a copy, because closing the stream also closes its descriptor.
   UniqueFd own(::fcntl(directory, F_DUPFD_CLOEXEC, 0));
   const Directory stream(::fdopendir(own.get()));
   if (!stream) return names;

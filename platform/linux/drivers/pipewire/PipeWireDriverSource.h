@@ -36,7 +36,7 @@ class PipeWireDriverSource final : public DriverSource {
   // Never waits for the server.
   [[nodiscard]] std::shared_ptr<const Reading> read() override;
 
-  // Whether the profiler is bound at the moment. Any thread may call. For tests.
+  // Returns whether the profiler is bound at the moment. Any thread may call it. For tests.
   [[nodiscard]] bool isProfiling() const;
 
  private:

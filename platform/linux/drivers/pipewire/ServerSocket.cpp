@@ -9,7 +9,7 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr const char* kDefaultName = "pipewire-0";
-// Where the library looks for a server of the whole machine when the user has none.
+// The place of a machine-wide server, where the library looks if the user has none.
 constexpr const char* kSystemDirectory = "/run/pipewire";
 
 std::string remoteName() {

@@ -5,11 +5,11 @@
 
 namespace halvox::platform::linux_ {
 
-// Where a client of PipeWire looks for the server's socket, best first, by the rules of its
-// library: the environment decides. Does not need the library.
+// Returns the places where a client of PipeWire looks for the server's socket, best first. They
+// depend on the environment, as in PipeWire's library. Does not need the library.
 [[nodiscard]] std::vector<std::filesystem::path> serverSocketPaths();
 
-// Whether one of them exists. A socket can outlive its server.
+// Returns whether a socket exists at one of these places. A socket can outlive its server.
 [[nodiscard]] bool hasServerSocket();
 
 }  // namespace halvox::platform::linux_

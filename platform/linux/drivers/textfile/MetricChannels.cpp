@@ -274,7 +274,7 @@ void ChannelMaker::addStateChannel(const MetricFamily& family, const MetricLabel
                                    const std::vector<const MetricSample*>& samples) {
   const MetricFamily* residency = counterNamed(family.name + "_residency");
   const MetricFamily* transitions = counterNamed(family.name + "_transitions");
-  // Which state holds now is not a count. Without the two counters there is nothing to report.
+  // The current state is not a count. Without the two counters there is nothing to report.
   if (residency == nullptr && transitions == nullptr) return;
   const std::size_t line = samples.front()->line;
   if (residency == nullptr) refuse(line, "expected a counter " + family.name + "_residency");

@@ -125,7 +125,7 @@ MetricLabels parseLabels(LineCursor& line) {
   return labels;
 }
 
-// Whether a sample's name may have this suffix after the name of a family of that type.
+// Returns whether a sample's name may have this suffix after the name of a family of that type.
 bool takesSuffix(MetricType type, std::string_view suffix) {
   // The values of a histogram are those of its parts, each with a suffix.
   if (suffix.empty()) return type != MetricType::kHistogram;
@@ -278,7 +278,8 @@ class Parser {
                     " values"};
     }
     std::string series = name;
-    // A label's value may contain any character. Its length keeps two series apart.
+    // A label's value may contain any character. Without its length, two series could have the same
+    // text.
     for (const auto& label : sample.labels) {
       series += '\n' + label.name + '=' + std::to_string(label.value.size()) + ':' + label.value;
     }
@@ -307,7 +308,7 @@ class Parser {
     return familyNamed(name);
   }
 
-  // The family of that name, added if it is new.
+  // Returns the family of that name. Adds it if it is new.
   MetricFamily& familyNamed(const std::string& name) {
     const auto [found, isNew] = positions_.try_emplace(name, families_.size());
     if (isNew) families_.push_back({.name = name});

@@ -57,7 +57,7 @@ struct MetricFamily {
   std::vector<MetricSample> samples{};
 };
 
-// What is wrong with a text, and in which line.
+// The error in a text, and its line.
 struct MetricError {
   std::size_t line = 0;
   std::string what{};

@@ -64,7 +64,8 @@ class WireBytes {
     u8(static_cast<std::uint8_t>(value.size())).raw(value);
     return raw(std::string_view("\0", 1));
   }
-  // An array whose length is that of `content`, which starts at the next such boundary.
+  // Appends an array. Its length is that of `content`, which starts at the next multiple of
+  // `alignment`.
   WireBytes& array(std::size_t alignment, std::string_view content) {
     return u32(static_cast<std::uint32_t>(content.size())).align(alignment).raw(content);
   }
