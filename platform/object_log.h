@@ -15,7 +15,7 @@ namespace halvox::platform {
 // Copies are cheap. Any thread may use it. The log service owns the category and must outlive this.
 class ObjectLog {
  public:
-  // `unit` is a constant.
+  // `unit` is not copied: pass a constant.
   ObjectLog(LogCategory& category, std::string_view unit) : category_(&category), unit_(unit) {}
 
   template <typename... Parts>

@@ -96,7 +96,7 @@ bool FakeDispatchService::runOne() {
   }
   const RunningMark mark(next.queue.get());
   next.job();
-  next.job = nullptr;  // what the job holds is released while the job counts as running
+  next.job = nullptr;  // releases what the job holds while the job still counts as running
   return true;
 }
 
@@ -152,7 +152,7 @@ FakeDispatchService::Waits::iterator FakeDispatchService::firstToTimeOut() {
 void FakeDispatchService::runDelayed(Job job) {
   const RunningMark mark(nullptr);
   job();
-  job = nullptr;  // what the job holds is released while the job counts as running
+  job = nullptr;  // releases what the job holds while the job still counts as running
 }
 
 void FakeDispatchService::moveTimeTo(std::chrono::nanoseconds time) {

@@ -38,8 +38,8 @@ Registry& registry() {
   return *instance;
 }
 
-// Removes the prefix: the unit's name, a colon, the line number in five places, and a space. The
-// name takes at least 25 places and contains no colon.
+// Removes the prefix: the unit's name, a colon, the line number padded to five characters, and a
+// space. The name is padded to 25 characters and contains no colon.
 std::string_view withoutPrefix(std::string_view line) {
   constexpr std::size_t kLineWidth = 5;
   const std::size_t colon = line.find(':');

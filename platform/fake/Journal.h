@@ -21,7 +21,7 @@ enum class JournalKind : unsigned char {
   kFile,             // text: the call for a directory or file, such as "file /a/b.json"
   kReply,            // text: the name of the method that was answered
   kTermination,      // text: the exit status
-  kNote,             // text: whatever the test wrote
+  kNote,             // text: what the test passed to note()
 };
 
 struct JournalEntry {

@@ -35,7 +35,7 @@ class LogQueue {
   // Replaces `entries` with all queued lines; waits while there are none. Returns false after
   // end(), once all lines were taken.
   bool take(std::vector<LogEntry>& entries);
-  // Refuses further lines and wakes the thread that takes.
+  // Refuses further lines and wakes the thread that takes lines.
   void end();
 
  private:

@@ -239,7 +239,7 @@ TEST_F(InotifyNotifyServiceTest, ADirectoryThatIsDeletedAndMadeAgainWorksAgain) 
 TEST_F(InotifyNotifyServiceTest, ADirectoryThatIsMovedAwayIsWatchedNoMore) {
   begin();
   std::filesystem::rename(notify(), scratch_ / "old");
-  waitUntilSettled();  // in the new one
+  waitUntilSettled();  // in the new directory
 
   EXPECT_EQ(postsOf([this] { write(scratch_ / "old" / kName, ""); }), 0);
   EXPECT_EQ(postsOf([this] { write(notify() / kName, ""); }), 1);

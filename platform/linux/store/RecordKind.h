@@ -29,7 +29,7 @@ struct TransactionAllowance {
   [[nodiscard]] bool isUsedUp() const { return records <= 0 || payloadBytes <= 0; }
 };
 
-// How many records left the queue, stored or dropped. WriterQueue::finish() needs to know.
+// How many records left the queue, stored or dropped. WriterQueue::finish() needs these numbers.
 struct FinishedRecords {
   std::uint64_t written = 0;       // written into a transaction, committed or not
   std::uint64_t writtenBytes = 0;  // the length of their payloads

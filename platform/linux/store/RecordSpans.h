@@ -36,7 +36,7 @@ class RecordSpans {
   // Writes the times of the current span.
   [[nodiscard]] SqliteCode flush();
   void onCommitted() { nextCommitted_ = next_; }
-  // Called after a failed transaction. Its numbers will be used again.
+  // Called after a failed transaction, whose numbers will be used again.
   void onRolledBack();
 
   // See RecordKind.

@@ -21,7 +21,8 @@ class SimpleRecordKind : public SpannedRecordKind {
   [[nodiscard]] bool hasTaken() const final { return next_ < taken_; }
 
  protected:
-  // The parameter of the record's first own column in the INSERT: 1 is the ID, 2 the time.
+  // The parameter of the record's first own column in the INSERT. Parameter 1 is the ID, and 2 is
+  // the time.
   static constexpr int kFirstColumn = 3;
 
   // What was bound to the INSERT.

@@ -37,7 +37,7 @@ class SpannedRecordKind : public RecordKind {
   struct Names {
     std::string_view records;  // the table of the records
     std::string_view spans;    // the table of their spans
-    std::string_view piece;    // under which they are counted
+    std::string_view piece;    // the name under which the records are counted
   };
 
   // Does not own its arguments, which must outlive it. `longestPayload` is in bytes.

@@ -29,8 +29,9 @@ DropReason reasonOf(SqliteCode code, int systemError) {
   return DropReason::kInputOutput;
 }
 
-// SQLite counts the memory that it uses, which takes a lock at each allocation. Nothing here reads
-// that count. SQLite accepts this setting only before its first use in the process.
+// Disables SQLite's count of the memory that it uses: counting takes a lock at each allocation, and
+// nothing here reads the count. SQLite accepts this setting only before its first use in the
+// process.
 void configureLibrary() {
   static const bool kDone = [] {
     sqlite3_config(SQLITE_CONFIG_MEMSTATUS, 0);

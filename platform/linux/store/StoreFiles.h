@@ -27,9 +27,10 @@ class StoreFiles {
  public:
   explicit StoreFiles(const std::filesystem::path& directory);
 
-  // Creates the directory and its parents, and takes the lock that keeps a second service out.
-  // Holds the lock until this object is destroyed. A second call is cheap and takes the lock again
-  // if the lock file was removed. Fails with kDirectory, kInUse or kCannotOpen.
+  // Creates the directory and its parents, and takes the lock that prevents a second service from
+  // using the store. Holds the lock until this object is destroyed. A second call is cheap and
+  // takes the lock again if the lock file was removed. Fails with kDirectory, kInUse or
+  // kCannotOpen.
   Result<void, StoreError> claimDirectory();
   // Creates an empty database file, readable by owner and group, unless one exists. First renames
   // a write-ahead log that has no database: SQLite deletes such a log when it opens an empty file.

@@ -42,7 +42,7 @@ class ResultsFile final : public Sswriter {
   ResultsFile(std::string_view product, std::uint32_t version)
       : product_(product), version_(version) {}
 
-  // Creates the unfinished file, so that a directory that cannot be written fails at the start.
+  // Creates the unfinished file, so that an unwritable directory is reported at the start.
   [[nodiscard]] std::optional<Error> begin(const RootedDirectory::Place& place, std::string name) {
     name_ = std::move(name);
     path_ = place.text() + (place.path.ends_with('/') ? "" : "/") + name_;

@@ -60,7 +60,8 @@ struct TraceOptions {
 // Whether a service that ended in the middle of a trace left something in that directory.
 [[nodiscard]] bool hasTraceLeftovers(const std::filesystem::path& tracesDirectory);
 
-// What is in the directory of traces while one is recorded, and where the tracer's daemon is noted.
+// Names in the directory of traces: the directory of the traces being recorded, and the file that
+// notes the tracer's daemon.
 inline constexpr const char* kTraceScratch = "scratch";
 inline constexpr const char* kTraceDaemonNote = "lttng-sessiond";
 

@@ -6,7 +6,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The log of one object of this folder, in the category that all of them share.
+// The log of one object, in the category that all objects of this folder share.
 inline ObjectLog tracingLog(LogService& log, std::string_view unit) {
   return {log.createCategory("com.tarno.halvox", "tracing"), unit};
 }

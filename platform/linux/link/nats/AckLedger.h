@@ -21,7 +21,7 @@ enum class AckOutcome : std::uint8_t {
   kRefused,  // the sender got an error instead; no flush counts it
 };
 
-// Accounts for the acknowledgements of one session, on which its flushes wait. A flush waits for
+// Accounts for the acknowledgements of one session, for which its flushes wait. A flush waits for
 // the messages added since the previous flush, never for later ones, and reports the result of
 // exactly these: a session that keeps sending must not delay its own flush. Threads: any; no
 // function blocks. A `done` callback runs on the thread that resolves the last message, or that

@@ -309,7 +309,8 @@ void NatsLink::end() {
   changed_.notifyAll();
 }
 
-// Calls back all callers of discover(): with the servers, or with nothing when none is connected.
+// Calls back all callers of discover(): with the servers, or with std::nullopt when none is
+// connected.
 void NatsLink::answerWaiters() {
   std::vector<Waiter> waiters;
   std::optional<Array> servers;

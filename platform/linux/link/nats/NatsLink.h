@@ -28,8 +28,8 @@ namespace halvox::platform::linux_ {
 //   lost: the library has closed the connection, for example because a server refused our
 //         credentials. The thread drops it; the next need makes a new one.
 //
-// There is at most one attempt to connect at a time; all callers of discover() wait for it, at most
-// kDiscoveryTime. After a failed attempt, the next one begins on demand, and not before
+// There is at most one attempt to connect at a time; all callers of discover() wait for it, but no
+// longer than kDiscoveryTime. After a failed attempt, the next one begins on demand, and not before
 // kAttemptPause has passed: an idle service without servers causes no wake-ups.
 //
 // An attempt of the library cannot be cancelled: it holds the lock of its connection object. It can
@@ -58,9 +58,9 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   NatsLink& operator=(const NatsLink&) = delete;
   ~NatsLink();  // calls close(), if the owner did not
 
-  // Calls `found` exactly once, and never before this returns. With the servers' addresses it calls
-  // on the link's thread, also when a server is connected already. With nothing it calls on that
-  // thread after a failed attempt, or on the background queue after kDiscoveryTime.
+  // Calls `found` exactly once, and never before this returns. Passes the servers' addresses on the
+  // link's thread, even if a server is connected already. Passes std::nullopt on that thread after
+  // a failed attempt, or on the background queue after kDiscoveryTime.
   void discover(TLMReportingService::BackendsCallback found) HALVOX_EXCLUDES(mutex_);
   // After close(), counts a message as refused and returns the error for its sender. Before
   // close(), returns none. Call it before creating a message: after close() the library has ended,
@@ -100,7 +100,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
 
   // Callers and the thread's loop (NatsLink.cpp).
   void run() HALVOX_EXCLUDES(mutex_);
-  // False after the last step.
+  // Returns false after the last step.
   [[nodiscard]] bool perform(Step step) HALVOX_EXCLUDES(mutex_);
   Step nextStep(Time now) HALVOX_REQUIRES(mutex_);
   [[nodiscard]] bool hasConnection() const HALVOX_REQUIRES(mutex_);
@@ -139,7 +139,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   Condition changed_;
   bool isIdle_ HALVOX_GUARDED_BY(mutex_) = false;  // the thread waits for a change
   State state_ HALVOX_GUARDED_BY(mutex_) = State::kIdle;
-  std::optional<Time> closeBy_ HALVOX_GUARDED_BY(mutex_);  // since close()
+  std::optional<Time> closeBy_ HALVOX_GUARDED_BY(mutex_);  // set by close()
   Time leaveBy_ HALVOX_GUARDED_BY(mutex_){};  // when close() stops waiting for the thread
   bool hasThreadEnded_ HALVOX_GUARDED_BY(mutex_) = false;
   Time nextAttempt_ HALVOX_GUARDED_BY(mutex_){};

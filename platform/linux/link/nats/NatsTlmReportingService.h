@@ -14,8 +14,8 @@ namespace halvox::platform::linux_ {
 //
 // and publishes it on the subject <subject>.<service name>.<session ID>, with an identifier by
 // which the stream recognises a second copy. A flush of a session that batches waits for the
-// acknowledgements of its messages, at most kFlushTime. Other sessions have no flush; their
-// acknowledgements are only counted.
+// acknowledgements of its messages, but no longer than kFlushTime. Other sessions have no flush;
+// their acknowledgements are only counted.
 // Threads: any, as the port says; only close() blocks.
 // Failures: a message that cannot be accepted is answered with an error; see NatsLink for what
 // happens to accepted messages.

@@ -78,7 +78,7 @@ class PendingAcks {
   struct Slot {
     Entry entry;
     NatsMessage held{};
-    bool isSettled = false;  // but stays until all older ones are
+    bool isSettled = false;  // a settled slot stays until all older ones are settled
   };
 
   Entry settle(Slot& slot);

@@ -27,7 +27,7 @@ struct DaemonProcess {
   // A process that has ended but that its parent has not waited for does not count as alive.
   [[nodiscard]] bool isAlive() const;
   // Ends the process with SIGTERM, and with SIGKILL if it has not ended in time. Blocks until it
-  // has ended, at most for twice the time.
+  // has ended, but no longer than twice the time.
   void end(std::chrono::milliseconds within) const;
 };
 

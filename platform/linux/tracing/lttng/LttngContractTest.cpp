@@ -41,7 +41,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// A session daemon for this test, with a home of its own. Ends with the test.
+// A session daemon for this test, with its own home directory. It ends with the test.
 class TestDaemon {
  public:
   TestDaemon() {

@@ -13,7 +13,7 @@ namespace {
 
 constexpr int kNotStarted = 1;
 constexpr int kNoRange = 2;
-constexpr int kUnsuitable = 3;  // no session, or not in the state for the call
+constexpr int kUnsuitable = 3;  // no session, or a call that is not allowed in its state
 // A batch is one job of the queue. Large enough that the job costs little compared with its events,
 // and small enough that a few batches take only a few megabytes.
 constexpr std::size_t kBatchEvents = 4096;

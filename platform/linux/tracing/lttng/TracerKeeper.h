@@ -43,7 +43,7 @@ class TracerKeeper {
   Result<DaemonProcess> keep(const Ward& ward, const DaemonProcess& daemon) {
     return launch(ward, daemon);
   }
-  // Waits until no keeper of an earlier service holds the note, at most `within`.
+  // Waits until no keeper of an earlier service holds the note, but no longer than `within`.
   static void awaitEarlier(const std::filesystem::path& noteFile, std::chrono::milliseconds within);
   // Lets the keeper do its work as at the end of the service, and waits until it has ended. Returns
   // false if there is no keeper or it was killed.
