@@ -37,7 +37,7 @@ void ClientWorker::tryConnect() {
   }
   pauseBeforeRetry();
   if (!closing_.load(std::memory_order_relaxed)) return;
-  // Nobody can receive the pending messages, so the destructor need not wait longer.
+  // The destructor need not wait longer, because no service can receive the pending messages.
   const MutexLock lock(mutex_);
   endNow_ = true;
   flushed_.notifyAll();

@@ -181,8 +181,9 @@ class HalvoxConnection {
   // Despite its name, returns the service type of a session; 65535 for an unknown session.
   Result<ServiceType> getServiceNameForReporterID(ReporterID id);
   Result<bool> setConfiguration(const Dictionary& configuration, ReporterID id);
-  // Returns when the service has carried out the start. The answer itself comes at the stop, so
-  // this sends a query after the start and waits for the answer to that.
+  // Returns when the service has carried out the start. The answer to the start itself arrives only
+  // at the stop. This function therefore sends a query after the start and waits for the query's
+  // answer.
   Result<bool> startReportingSessionForID(ReporterID id);
   // Blocks until the last start of that session is answered, at most for `timeout`.
   Result<bool> waitForStartReply(ReporterID id, std::chrono::milliseconds timeout);
@@ -191,7 +192,7 @@ class HalvoxConnection {
                            const std::optional<std::vector<ReporterID>>& ids);
   Result<bool> stopReportingSessionForID(ReporterID id);
   Result<bool> destroyReportingSession(ReporterID id);
-  // "reporterID" and "serviceType" of a session; 0 and 65535 for an unknown one.
+  // Returns "reporterID" and "serviceType" of a session; 0 and 65535 for an unknown one.
   Result<Dictionary> reporterIDValid(ReporterID id);
   // The IDs of the sessions of all clients.
   Result<std::vector<ReporterID>> getAllReporters();

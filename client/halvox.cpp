@@ -145,7 +145,7 @@ size_t halvox_category_name(uint32_t category, char* buffer, size_t size) {
   return fill(client::categoryName(category), buffer, size);
 }
 
-// The names are string literals, so their views end with a NUL.
+// The names are string literals, whose characters end with a NUL.
 const char* halvox_event_type_name(uint16_t type) { return client::eventTypeName(type).data(); }
 
 const char* halvox_service_type_name(uint16_t type) { return client::serviceTypeName(type).data(); }

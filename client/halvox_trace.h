@@ -11,7 +11,7 @@
  * The service records the codes from 0x21040000 to 0x2104408A. While no trace runs, a trace point
  * only tests one number. While one runs, a trace point writes its numbers, the time, the thread and
  * the process into a buffer. It never blocks: an event that finds no room is lost, and the trace
- * counts it. Any thread may call, including real-time threads.
+ * counts it. Any thread may call halvox_trace(), including real-time threads.
  *
  * Link with -lhalvox-trace. The library loads the LTTng tracer, which has two threads in the
  * process; they sleep until a tracer's daemon runs. Built without LTTng, the library emits nothing.

@@ -19,8 +19,8 @@ struct ProcessStat {
 // process chooses its own name.
 [[nodiscard]] std::optional<ProcessStat> parseProcessStat(std::string_view text);
 
-// Reads the file of a process; none if there is no such process. Does not block. Any thread may
-// call.
+// Reads the file of a process. Returns std::nullopt if the process does not exist. Does not block.
+// Any thread may call it.
 [[nodiscard]] std::optional<ProcessStat> readProcessStat(pid_t pid);
 
 // The same for this process. Also correct if /proc shows the processes of another PID namespace,

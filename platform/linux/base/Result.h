@@ -62,7 +62,7 @@ class [[nodiscard]] Result {
   std::variant<Value, Error> state_;
 };
 
-// Nothing, or why it could not be done. `return {};` is success.
+// Success without a value, or why something could not be done. `return {};` is success.
 template <typename Code>
 class [[nodiscard]] Result<void, Code> {
  public:

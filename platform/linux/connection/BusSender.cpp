@@ -65,7 +65,7 @@ void BusSender::onVanished() {
 }
 
 void BusSender::onBusLost() {
-  // The delegate has not been asked about an unknown sender, so it has no handlers to call.
+  // An unknown sender has no handlers to call, because the delegate has not been asked about it.
   isKnown_ ? end(Why::kPeerVanished) : abandon();
 }
 

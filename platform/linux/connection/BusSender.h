@@ -17,11 +17,11 @@ class BusConnection;
 //       delivered --the name vanishes--> ended
 //
 // Its requests arrive on the bus's connection. They wait here until the bus has said who the sender
-// is, and while flow control holds the sender back. The bus cannot be asked to hold one sender
-// back, so requests beyond kMaxWaitingBytesOfSender are refused. Replies that the sender does not
-// read are kept and bounded by the bus. A sender that left before the bus could answer is served as
-// process 0 of an unknown user, because some of its requests may need no reply. Belongs to the I/O
-// thread. Shared by the bus's connection and the delegate.
+// is, and while flow control holds the sender back. The bus cannot hold back one sender: requests
+// beyond kMaxWaitingBytesOfSender are refused. Replies that the sender does not read are kept and
+// bounded by the bus. A sender that left before the bus could answer is served as process 0 of an
+// unknown user, because some of its requests may need no reply. Belongs to the I/O thread. Shared
+// by the bus's connection and the delegate.
 class BusSender final : public ClientConnection, private DeadlineOwner {
  public:
   BusSender(ConnectionHost& host, BusConnection& bus, std::string name);

@@ -83,8 +83,8 @@ class ClientConnection : public NSXPCConnection,
   // The client broke the rules of the wire. `what` describes how and at which byte.
   virtual void onMalformed(const std::string& what);
 
-  // Returns true for a client on our own socket. It has no bus, so the service answers calls to the
-  // bus.
+  // Returns true for a client on our own socket. It has no bus: the service answers its calls to
+  // the bus.
   [[nodiscard]] virtual bool isPeerToPeer() const = 0;
   // Returns true only at the first call: a client must send Hello to the bus exactly once.
   [[nodiscard]] bool takeHello();

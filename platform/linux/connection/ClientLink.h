@@ -66,7 +66,7 @@ class OpenRequest {
 // The right to answer one request once. All copies of the request's ReplyCallback share it.
 class ReplyTicket {
  public:
-  // `signature` is that of the reply; it is a constant.
+  // `signature` is the signature of the reply, and must be a constant: it is not copied.
   ReplyTicket(std::shared_ptr<ClientLink> client, std::uint32_t serial, std::string_view signature)
       : client_(std::move(client)), serial_(serial), signature_(signature) {}
 

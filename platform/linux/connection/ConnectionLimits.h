@@ -26,8 +26,8 @@ inline constexpr std::size_t kListRequestWeight = 64;
 inline constexpr std::size_t kMaxUnreadReplies = 256;
 inline constexpr std::size_t kMaxUnreadReplyBytes = 4 * kMiB;
 
-// How many bytes of requests of one sender on a bus may wait. The bus cannot be asked to hold one
-// sender back, so requests beyond this are refused.
+// How many bytes of requests of one sender on a bus may wait. The bus cannot hold back one sender:
+// requests beyond this are refused.
 inline constexpr std::size_t kMaxWaitingBytesOfSender = 4 * kMiB;
 
 // The size of one read. Frames larger than this get a buffer of their own.

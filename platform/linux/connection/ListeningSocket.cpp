@@ -49,7 +49,7 @@ bool ListeningSocket::acceptOne() {
   UniqueFd fd(accept4(fd_.get(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
   if (fd) {
     isShort_ = false;
-    // Without credentials nothing is known about the client, so it is disconnected.
+    // Disconnect a client without credentials, about which nothing is known.
     if (const std::optional<PeerCredentials> credentials = credentialsOf(fd.get())) {
       host_.acceptPeer(std::move(fd), *credentials);
     }

@@ -46,7 +46,7 @@ ReadEnd readOutput(int descriptor, std::size_t most, const CaptureDeadline& dead
       output.resize(most);
       return ReadEnd::kTooMuch;
     }
-    // poll() never times out while a program prints without a pause, so test the time here too.
+    // Test the time here too: poll() never times out while a program prints without a pause.
     if (deadline.hasPassed()) return ReadEnd::kTimeOver;
   }
 }

@@ -28,10 +28,11 @@ class OwnThreadQueue;
 // may call its functions, unless a comment says otherwise.
 //
 // Quality of service: utility and background work runs at a lower scheduling priority. A thread
-// cannot raise its priority again without a privilege, so the pool has threads for each quality,
-// made when they are first needed. What requests wait for must not have a lower quality than the
-// requests. The label of a queue names its own thread, or counts the jobs of shared queues: a stuck
-// queue has more jobs added than run, and the log names it if it keeps the service from ending.
+// cannot raise its priority again without a privilege. The pool therefore has threads for each
+// quality, which it makes when they are first needed. What requests wait for must not have a lower
+// quality than the requests. The label of a queue names its own thread, or counts the jobs of
+// shared queues: a stuck queue has more jobs added than run, and the log names it if it keeps the
+// service from ending.
 //
 // Helping: the I/O thread, which delivers a batch of requests, does so between beginHelping() and
 // endHelping(). Brief jobs that it adds meanwhile to a queue with its own thread do not wake that

@@ -18,7 +18,8 @@ namespace {
 // The clock ends 292 years after the start of the machine. A delay up to ten years cannot overflow.
 constexpr std::chrono::nanoseconds kLongestDelay = std::chrono::hours(24 * 3652);
 
-// CLOCK_MONOTONIC is what std::chrono::steady_clock reads, so its times can be used unchanged.
+// CLOCK_MONOTONIC is what std::chrono::steady_clock reads, and its times can therefore be used
+// unchanged.
 int createTimer() {
   const int timer = ::timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK);
   if (timer < 0) throw std::system_error(errno, std::generic_category(), "timerfd_create");

@@ -20,9 +20,9 @@ DispatchPool::~DispatchPool() {
   static_cast<void>(waitForEnd(std::chrono::steady_clock::time_point::max()));
 }
 
-// A new thread starts with the priority of the thread that makes it. Background threads are made by
-// callers of at least utility priority (the timer is watched by utility threads), so no thread gets
-// a lower priority than its quality's.
+// A new thread starts with the priority of the thread that makes it. Only threads of at least
+// utility priority make background threads, because utility threads watch the timer. No thread
+// therefore gets a lower priority than its quality's.
 asio::io_context& DispatchPool::context(QualityOfService quality) {
   switch (quality) {
     case QualityOfService::kUserInteractive:

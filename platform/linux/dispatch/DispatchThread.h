@@ -35,7 +35,7 @@ class DispatchThread {
   // be nested.
   class Working {
    public:
-    // The caller keeps `label`, which names the queue in the log.
+    // The caller owns `label`, which names the queue in the log.
     Working(const DispatchQueue* queue, std::string_view label)
         : thread_(current()),
           outerQueue_(std::exchange(thread_.queue_, queue)),

@@ -115,7 +115,7 @@ TEST_F(QualityOfServiceTest, BackgroundJobsThatBlockDelayNeitherQueuesNorTimeOut
   ASSERT_EQ(ended.wait_for(kTestDeadline), std::future_status::ready);
   EXPECT_EQ(ended.get(), WaitOutcome::kTimedOut);
   release.set_value();
-  EXPECT_TRUE(eventually([&] { return blocked == 10; }));  // no job uses it afterwards
+  EXPECT_TRUE(eventually([&] { return blocked == 10; }));  // no job uses `blocked` after this
 }
 
 TEST_F(QualityOfServiceTest, WithoutMoreThreadsToHaveTheOthersDoTheWork) {

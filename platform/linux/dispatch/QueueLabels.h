@@ -25,7 +25,7 @@ struct QueueLabel {
 
 // The labels of the shared queues, one for each text. Labels are never removed: their texts are
 // constants of the code, which all sessions share. Owns the labels; belongs to the pool. Any thread
-// may call.
+// may use it.
 class QueueLabels {
  public:
   // `statistics` must outlive this.

@@ -7,8 +7,9 @@
 
 namespace halvox::platform::linux_ {
 
-// Creates directories and files below a root directory. Follows no symbolic link below the root, so
-// nothing is written outside it. A file gets its name only when its content is on the disk.
+// Creates directories and files below a root directory. Follows no symbolic link below the root,
+// and therefore writes nothing outside it. A file gets its name only when its content is on the
+// disk.
 //
 // Any thread may use the service; a file belongs to one thread. Blocks on the disk. Every failure
 // is an Error with the path and the system's text. Invalid file names are errors: those that are

@@ -151,8 +151,8 @@ class FieldReader {
     return false;
   }
 
-  // The rules of names allow ASCII characters only, so the check for UTF-8 is not needed. It would
-  // read every name twice.
+  // The rules of names allow only ASCII characters. A check for UTF-8 is not needed, and would read
+  // every name twice.
   bool readName(std::string_view& name, bool (*isValid)(std::string_view)) {
     return reader_.readUncheckedText(name) && (isValid(name) || reader_.fail("invalid name"));
   }
@@ -176,7 +176,7 @@ class FieldReader {
         return fieldBit(HeaderField::kPath) | fieldBit(HeaderField::kInterface) |
                fieldBit(HeaderField::kMember);
     }
-    // The dispatcher ignores such messages, so it does not matter which fields they have.
+    // The fields do not matter, because the dispatcher ignores such messages.
     return 0;  // an unknown type
   }
 

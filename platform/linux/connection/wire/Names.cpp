@@ -56,7 +56,7 @@ constexpr ElementRules kUniqueRules{'.', kWord | kHyphen, kWord | kHyphen};
 }  // namespace
 
 bool isObjectPath(std::string_view text) {
-  // D-Bus does not limit the length of paths, so neither does this.
+  // The length is not limited: D-Bus does not limit the length of paths.
   if (text.empty() || text.front() != '/') return false;
   return text.size() == 1 || countElements(text.substr(1), kPathRules) > 0;
 }

@@ -35,7 +35,8 @@ class TypeScanner {
   bool scanType(unsigned arrays, unsigned structs) {
     const char code = next();
     const Role role = roleOf(code);
-    // Continues: a rest that is invalid makes the message malformed, which ends the connection.
+    // Continue scanning: if the rest is invalid, the message is malformed, which ends the
+    // connection.
     if (arrays > kMaxSignatureNesting || structs > kMaxSignatureNesting) tooDeep_ = true;
     if (code == 'a') {
       return peek() == '{' ? scanEntry(arrays + 1, structs + 1) : scanType(arrays + 1, structs);

@@ -181,8 +181,8 @@ Value Decoder::decodeArray(std::string_view type, unsigned level) {
   if (!reader_.enterArray(alignmentOf(elementType.front()), outerLimit)) return malformed(type);
   const std::size_t first = scratch_.values.size();
   for (std::size_t element = 0; !reader_.atLimit(); ++element) {
-    // An inner array takes its elements off the scratch again, so the elements of this one stay
-    // together.
+    // The elements of this array stay together, because an inner array removes its own elements
+    // from the scratch again.
     scratch_.values.push_back(decode(elementType, level));
     if (failed_) {
       path_.putBefore(element);

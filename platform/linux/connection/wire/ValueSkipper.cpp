@@ -6,8 +6,8 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// The recursion ends at kMaxNesting: each variant can hold another one, so the length of the
-// signature bounds nothing.
+// kMaxNesting bounds the recursion. The length of the signature does not: each variant can hold
+// another one.
 bool skip(WireReader& reader, std::string_view type, unsigned level);
 
 template <typename Number>

@@ -243,7 +243,7 @@ void GraphFollower::onServerReached(const pw_core_info& server) {
 void GraphFollower::onServerLost() {
   isLost_ = true;
   log_.notice("the connection to PipeWire ended; waiting for the server while sessions run");
-  // Disconnect from the timer: the library does not allow that inside this call.
+  // Let the timer's callback disconnect: the library does not allow that inside this call.
   proceedAfter(Clock::duration::zero());
 }
 

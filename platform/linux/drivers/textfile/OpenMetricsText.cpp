@@ -252,7 +252,7 @@ class Parser {
     line.skipBlanks();
     sample.number = parseNumber(line.takeUntilBlank());
     line.skipBlanks();
-    // A time stamp. Counters are sampled now, so it has no use here.
+    // A time stamp. It is not used, because counters are sampled now.
     if (!line.isAtEnd() && !line.startsWith('#'))
       static_cast<void>(parseNumber(line.takeUntilBlank()));
     line.skipBlanks();
