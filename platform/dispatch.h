@@ -21,8 +21,8 @@ enum class QualityOfService : std::uint8_t { kUserInteractive, kUtility, kBackgr
 // that blocks, or that must never wait for others, needs a thread of its own.
 enum class QueueThreading : std::uint8_t { kOwnThread, kShared };
 
-// Whether a job can block (on a file, a server or another queue). A brief job cannot, which allows
-// a thread that must not block, such as the I/O thread, to run it.
+// Whether a job can block (on a file, a server or another queue). A brief job cannot block. A
+// thread that must not block, such as the I/O thread, can therefore run it.
 enum class JobWeight : std::uint8_t { kBrief, kMayBlock };
 
 // Counts signals until they are consumed. Any thread may signal, and a signal without a waiter is

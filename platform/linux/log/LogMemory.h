@@ -58,7 +58,7 @@ class LogMemory {
   const Bounds bounds_;
   mutable Mutex mutex_;
   // Both have their full address range from the start; the kernel provides memory as lines arrive.
-  std::vector<Line> lines_ HALVOX_GUARDED_BY(mutex_);  // a ring, once full
+  std::vector<Line> lines_ HALVOX_GUARDED_BY(mutex_);  // a ring once it is full
   std::unique_ptr<char[]> ring_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t firstLine_ HALVOX_GUARDED_BY(mutex_) = 0;
   std::uint64_t endLine_ HALVOX_GUARDED_BY(mutex_) = 0;

@@ -44,7 +44,8 @@ struct SettingBaseline {
 //
 // Remembers the last state of each file and compares with it, so that it also finds changes that
 // were not announced. A preference file that cannot be read counts as unchanged until it can be
-// read. Owned by InotifyNotifyService and used on its thread, except look(). Blocks on the disk.
+// read.
+// Owned by InotifyNotifyService and used on its thread, except look(). Blocks on the disk.
 class WatchedSettings {
  public:
   // Does not own the reader and the statistics, which must outlive it.

@@ -24,7 +24,7 @@ constexpr std::uint64_t kLargestTransaction = 2 * kMegabyte;
 // Must stay below the 1,000,000,000 bytes that SQLite accepts for one value.
 constexpr std::uint64_t kLargestPayload = 256 * kMegabyte;
 // How long the writer waits for a lock of another process before it drops the records being
-// written. Half of the half second within which a stored record must be visible.
+// written. This is half of the half second within which a stored record must be visible.
 constexpr std::chrono::milliseconds kBusyTimeout{250};
 
 Failure<StoreError> failure(StoreError code, const StoreFiles& files, const std::string& what) {

@@ -12,8 +12,8 @@ namespace {
 //
 // The time has no index, which would raise SQLite's CPU time per message from 2.2 to 3.0 us.
 // analytics_spans holds the first and the last time of every 512 records instead. It is written
-// once a transaction and once every 512 records. Readers use it to find a range of time, and
-// retention to find expired records.
+// once for each transaction and once for every 512 records. Readers use it to find a range of time,
+// and retention to find expired records.
 //
 // The view uses CROSS JOIN because SQLite does not reorder the tables of such a join: its rows are
 // in the order in which the events were sent, without a sort.

@@ -44,8 +44,8 @@ class PendingAcks {
   // Whether one more message may be published. Its size does not matter: otherwise a message larger
   // than the window could never be published.
   [[nodiscard]] bool hasRoom() const { return size_ < window_.messages && bytes_ < window_.bytes; }
-  // Whether half of the window is free. The publisher waits for this after a full window: waking it
-  // for each acknowledgement would cost more than the publishing.
+  // Whether half of the window is free. The publisher waits for this after the window was full:
+  // waking it for each acknowledgement would cost more than publishing.
   [[nodiscard]] bool isHalfFree() const {
     return size_ <= window_.messages / 2 && bytes_ <= window_.bytes / 2;
   }

@@ -42,7 +42,7 @@ Result<void, StoreError> EventFollower::open(const std::filesystem::path& direct
   directory_ = directory;
   filter_ = filter;
   started_ = false;
-  // Callers wait on one descriptor, which stands for both sources.
+  // Callers wait on one descriptor, which covers both sources.
   poller_.reset(::epoll_create1(EPOLL_CLOEXEC));
   timer_.reset(::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC));
   watch_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));

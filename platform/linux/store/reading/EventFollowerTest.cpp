@@ -134,7 +134,7 @@ TEST_F(EventFollowerTest, IsQuietWhileNothingIsWritten) {
   ASSERT_TRUE(follower.open(options.directory, {}));
   ASSERT_TRUE(follow(1));
   pollfd waiting{follower.descriptor(), POLLIN, 0};
-  EXPECT_EQ(::poll(&waiting, 1, 300), 0);  // returns at once when the follower is woken
+  EXPECT_EQ(::poll(&waiting, 1, 300), 0);  // would return at once if the follower were woken
 }
 
 TEST_F(EventFollowerTest, SaysThatThereIsNothingToFollow) {

@@ -18,8 +18,8 @@ struct RecordBounds {
   std::int64_t last = 0;
 };
 
-// Narrows the bounds to the filter's times by means of the spans, without reading records. The
-// caller sets `bounds.first` to the first record that it may need.
+// Narrows the bounds to the filter's times. Uses the spans and reads no records. The caller sets
+// `bounds.first` to the first record that it may need.
 [[nodiscard]] SqliteCode findBounds(Database& database, const std::string& recordsTable,
                                     const std::string& spansTable, const RecordFilter& filter,
                                     RecordBounds& bounds);
