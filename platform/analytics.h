@@ -15,8 +15,8 @@ using AnalyticsPayloadBuilder = std::function<Dictionary()>;
 
 // Collects named events.
 //
-// There are two steps: a cheap question, then a builder that runs on another thread. Building and
-// encoding a payload is expensive, and not every event is collected.
+// There are two steps: a cheap test of the name, then a builder that runs on another thread.
+// Building and encoding a payload is expensive, and not every event is collected.
 //
 // Any thread may call. The composition root owns the service. A failure of storage is not reported
 // to the caller: the service counts the events that it drops, and logs them.

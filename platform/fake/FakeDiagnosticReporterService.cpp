@@ -10,7 +10,7 @@ struct FakeDiagnosticReporterService::Requests {
   Journal& journal;  // outlives every call of a reporter
   std::mutex mutex;
   std::vector<Request> asked;
-  std::vector<AILDiagnosticReporter::Reply> replies;  // by request; empty after it was given
+  std::vector<AILDiagnosticReporter::Reply> replies;  // by request; empty once the reply was given
 };
 
 class FakeDiagnosticReporterService::Reporter final : public AILDiagnosticReporter {

@@ -24,7 +24,7 @@ class FakeLogCategory final : public LogCategory {
 
 namespace {
 
-// Outlives the services: the categories, and the service that they write to now.
+// The categories, and the service that they write to now. Outlives the services.
 struct Registry {
   std::mutex mutex;
   std::map<std::pair<std::string, std::string>, std::unique_ptr<FakeLogCategory>> categories;

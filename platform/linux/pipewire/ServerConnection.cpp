@@ -56,8 +56,8 @@ void ServerConnection::onCoreDone(void* data, std::uint32_t id, int sequence) {
 void ServerConnection::onCoreError(void* data, std::uint32_t id, int /*sequence*/, int result,
                                    const char* message) {
   auto* self = static_cast<ServerConnection*>(data);
-  // EPIPE at the core is how the library reports the end of the connection. Any other error is
-  // about one object.
+  // The library reports the end of the connection as EPIPE for the core. Any other error concerns
+  // one object.
   if (id != PW_ID_CORE || result != -EPIPE) {
     if (result != -ENOENT) self->listener_.onRefused(id, message);
     return;

@@ -60,7 +60,7 @@ SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
 SqliteCode Retention::prepare(Database& database) {
   // Read the size from SQLite: a database that another program made may have pages of another size.
   pageBytes_ = static_cast<std::uint64_t>(database.queryInteger("PRAGMA page_size").value_or(0));
-  // Vacuum writes each page that it moves to the log. Move so few at a time that the log does not
+  // Vacuum writes each moved page to the log. Move so few pages at a time that the log does not
   // outgrow its limit.
   const std::uint64_t vacuumPages =
       limits_.transactionBytes / (2 * std::max(pageBytes_, kLeastPage));

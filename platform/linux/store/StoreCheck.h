@@ -33,7 +33,7 @@ namespace halvox::platform::linux_ {
 class StoreCheck {
  public:
   // Called at most once, on the thread of the check, after finding() has its value. Must not call
-  // stop(), which would wait for itself.
+  // stop(), which waits for that thread.
   using OnDamage = std::function<void()>;
 
   StoreCheck() = default;

@@ -47,7 +47,8 @@ Result<void, StoreError> EventFollower::open(const std::filesystem::path& direct
   timer_.reset(::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC));
   watch_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (!poller_ || !timer_ || !watch_) return systemFailure(directory);
-  // Watch before the first read. A record stored between the two would otherwise go unnoticed.
+  // Watch before the first read. A record stored after the read but before the watch would go
+  // unnoticed.
   if (::inotify_add_watch(watch_.get(), directory.c_str(), kWatched) < 0) {
     return systemFailure(directory);
   }
