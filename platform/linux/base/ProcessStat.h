@@ -11,7 +11,7 @@ namespace halvox::platform::linux_ {
 // Fields of /proc/<pid>/stat. See proc(5).
 struct ProcessStat {
   char state = '?';            // field 3: 'Z' has ended, but its parent has not waited for it
-  std::uint64_t startTicks{};  // field 22: clock ticks from the start of the system to its start
+  std::uint64_t startTicks{};  // field 22: clock ticks from the system's start to the process's
 };
 
 // Parses the text of such a file. Returns std::nullopt if the text is malformed or ends before the

@@ -22,9 +22,9 @@ class TurnSchedule {
   TurnSchedule(std::function<void()> beginBatch, std::function<void()> endBatch,
                std::function<void()> afterReplies);
 
-  // The client delivers in the next turn.
+  // Lets the client deliver in the next turn.
   void deliverNext(std::shared_ptr<ClientConnection> client);
-  // The client delivers after the store has caught up.
+  // Lets the client deliver after the store has caught up.
   void deliverWhenRelieved(std::shared_ptr<ClientConnection> client);
   void flushLater(SocketStream& stream);
   // Finishes a client that has ended. Does so in the next turn, after the client's last replies

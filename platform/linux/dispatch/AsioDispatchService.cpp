@@ -19,7 +19,7 @@ AsioDispatchService::AsioDispatchService(LogService& log, StatisticsService& sta
       runner_(std::make_shared<JobRunner>(log, statistics)),
       pool_(std::make_shared<DispatchPool>(runner_, statistics)) {}
 
-// A year stands for no limit: unlike the maximum, it can be added to the current time.
+// A year stands for no limit: unlike the largest duration, it can be added to the current time.
 AsioDispatchService::~AsioDispatchService() { stop(std::chrono::hours(24 * 365)); }
 
 std::shared_ptr<DispatchQueue> AsioDispatchService::createSerialQueue(std::string_view label,

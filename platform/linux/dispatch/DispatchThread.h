@@ -18,9 +18,9 @@ class SharedQueue;
 //   helping: off --beginHelping()--> on --endHelping(): runs the brief jobs it added--> off
 //   holding: off --holdPool()--> on --wakePool(): begins the noted turns--> off
 //
-// This is the only thread-local of the adapter. It has to be one: the inner ring calls
-// DispatchQueue::async(), and knows no batch that it could pass. Belongs to its thread; no other
-// thread may touch it. When the thread ends, it ends helping and holding if they are still on.
+// This is the only thread-local of the adapter. It has to be one: the inner ring, which calls
+// DispatchQueue::async(), has no batch that it could pass. Belongs to its thread; no other thread
+// may touch it. When the thread ends, it ends helping and holding if they are still on.
 class DispatchThread {
  public:
   // Returns the calling thread's object.

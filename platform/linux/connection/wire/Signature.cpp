@@ -138,7 +138,7 @@ std::size_t alignmentOf(char typeCode) {
     case '(':
     case '{':
       return 8;
-    default:  // y, g, v, and what is not a type
+    default:  // y, g, v, and characters that are not types
       return 1;
   }
 }

@@ -11,8 +11,8 @@
 namespace halvox::platform::linux_ {
 
 // The PipeWire source without PipeWire's library, until that is needed: it loads the module with
-// the source when the service starts and there is a server's socket, else when a session takes its
-// first sample. A service that does neither does not map the library.
+// the source at the start of the service if there is a server's socket, and otherwise at the first
+// sample of a session. Until then the service does not map the library.
 //
 //   waiting --socket at the start, or first sample--> loaded
 //      |

@@ -15,9 +15,10 @@ namespace halvox::platform::linux_ {
 // socket.
 //
 // The environment at construction decides where that is, by the library's own rules. It watches
-// only between begin() and end(), with inotify instead of a timer, which makes waiting for a server
-// free. Belongs to the loop's thread, or to a caller that knows that this thread does not run.
-// GraphFollower owns it. Without the directory, or without inotify, it never calls back.
+// only between begin() and end(), with inotify instead of a timer, and waiting for a server
+// therefore costs nothing. Belongs to the loop's thread, or to a caller that knows that this thread
+// does not run. GraphFollower owns it. Without the directory, or without inotify, it never calls
+// back.
 class ServerWatch {
  public:
   // `onAppeared` may call end().
