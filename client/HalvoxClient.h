@@ -114,7 +114,7 @@ class HalvoxClient {
 
   // The steps of a session's life, in their order. They return at once. A step for a session that
   // the service does not know has no effect, and the service reports no error. setConfiguration()
-  // merges the dictionary into what the session has.
+  // merges the dictionary into the session's configuration.
   void createSession(ReporterID id);
   void setServiceType(ReporterID id, ServiceType type);
   void setConfiguration(ReporterID id, Dictionary configuration);

@@ -26,8 +26,8 @@
  * reading. While one thread changes it, no other thread may use it.
  *
  * Ownership: release the result of a ..._new function with the ..._free function of the same kind;
- * these accept NULL and do nothing. Functions copy all other arguments before they return. For
- * dictionaries and arrays that is a reference count, not their content.
+ * these accept NULL and do nothing. Functions copy all other arguments before they return. Copying
+ * a dictionary or an array only increments a reference count.
  *
  * Errors: functions that can fail return a halvox_result, or NULL or false as their comment says.
  * Passing NULL where a client, dictionary or array is needed is HALVOX_BAD_ARGUMENT, never a crash.

@@ -28,7 +28,7 @@ class UnfinishedFile {
   // Creates the file. `naming` is for tests; kOwnName uses a temporary name on every file system.
   [[nodiscard]] int begin(UniqueFd directory, Naming naming = Naming::kNoName);
   [[nodiscard]] int write(std::string_view bytes);
-  // Syncs the file to the disk, then gives it its name and replaces a file that has it.
+  // Syncs the file to the disk, then gives it its name. Replaces an existing file of that name.
   [[nodiscard]] int finish(const std::string& name);
   // Deletes the file unless it was finished. Idempotent.
   void discard();
