@@ -36,8 +36,8 @@ class KQTraceSessionDelegate {
 //   made --start--> recording --stop--> saved, its completion is reported
 //        --start fails--> made
 //
-// Shared by the code that started it and, while it works, by the service. If nobody else holds it
-// while it records, the recording ends, its data is deleted, and the delegate is not called.
+// Shared by the code that started it and, while it works, by the service. If only the service holds
+// it while it records, the recording ends, its data is deleted, and the delegate is not called.
 //
 // Any thread may call. A start during a recording does nothing, nor does a stop outside of one.
 // Every failure is reported to the delegate.

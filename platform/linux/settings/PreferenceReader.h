@@ -15,8 +15,8 @@ namespace halvox::platform::linux_ {
 // Reads preference files for the service, and logs what is wrong with them.
 //
 // A mistake is logged once for each state of the file, however often the file is read, because
-// clients trigger the reads. A fixed file is also logged once. Owned by the platform. Any thread
-// may call. Each call reads the file and blocks on the disk.
+// clients trigger the reads. That a file is fixed is also logged once. Owned by the platform. Any
+// thread may call. Each call reads the file and blocks on the disk.
 class PreferenceReader {
  public:
   // `log` must outlive the reader.

@@ -191,8 +191,8 @@ class BinaryShape {
     if (child >= objects_) return kNotBinary;
     switch (weights_[child].state) {
       case Weight::State::kNew:
-        // Check the depth before reading the child: otherwise the stack would grow without end with
-        // a list that nests without end.
+        // Check the depth before reading the child: otherwise a deeply nested list would make the
+        // stack grow without limit.
         if (open_.size() > bounds_.depth) return kTooDeep;
         return push(child);  // and continues here when the child is done
       case Weight::State::kOpen:

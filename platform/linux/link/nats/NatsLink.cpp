@@ -40,7 +40,8 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
   {
     const MutexLock lock(mutex_);
     const bool isRefused = closeBy_.has_value();
-    // The first session that calls starts the thread: a service without sessions needs no link.
+    // The first session that looks for back-ends starts the thread: a service without sessions
+    // needs no link.
     if (!isRefused) failure = provideThread();
     if (!isRefused && failure.empty()) {
       wakeThread();

@@ -276,7 +276,7 @@ void NatsPublisher::publish(std::vector<NatsMessage> messages, std::chrono::mill
   }
 }
 
-// Keeps messages whose attempt failed for another attempt.
+// Keeps messages for another attempt after one has failed.
 void NatsPublisher::hold(std::span<NatsMessage> messages, natsStatus status) {
   std::optional<std::uint64_t> worthALine;
   {
