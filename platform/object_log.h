@@ -7,8 +7,9 @@
 namespace halvox::platform {
 
 // Writes the log lines of one object. It has the category that the object received when it was
-// made, and the name of the object's unit. An object that is given the log service has one of these
-// as a member, in place of a UnitLog, whose category is looked up once for the life of the process.
+// made, and the name of the object's unit. An object that receives the log service has one of these
+// as a member. A UnitLog would be wrong there, because it looks its category up once for the life
+// of the process.
 //
 //   log_.info("watching ", directory);
 //

@@ -77,8 +77,7 @@ void addFollower(const ReadNode& read, ProfiledCycle& cycle) {
   if (read.stage < kFinished) cycle.late.push_back(read.node.id);
 }
 
-// Reads the count of xruns, which is the last of the figures about the load. The others are not
-// used.
+// Reads the count of xruns, which is the last of the load figures. The others are not used.
 std::uint32_t readXruns(const spa_pod& value) {
   std::int64_t counter = 0;
   float fast = 0;

@@ -40,8 +40,8 @@ class IndentedJsonArray::Text {
     isTaken_ = true;
     return text_;
   }
-  // Discards the text that was taken. Called before anything is added: until then the caller reads
-  // it.
+  // Discards the text that the caller has taken. Called just before text is appended, because the
+  // caller may read the old text until then.
   void begin() {
     if (isTaken_) text_.clear();
     isTaken_ = false;

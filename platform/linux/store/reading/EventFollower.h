@@ -24,8 +24,8 @@ class EventFollower {
   // Becomes readable (poll) when deliver() should be called. Owned by this object.
   [[nodiscard]] int descriptor() const { return poller_.get(); }
   // Calls `callback` on this thread for each event that was stored since the last delivery. Does
-  // not wait for events. Returns an error, after which following ends, when the directory was
-  // removed or the database cannot be read.
+  // not wait for events. Returns an error when the directory was removed or the database cannot be
+  // read. Following then ends.
   Result<void, StoreError> deliver(const StoreReader::EventCallback& callback);
   // Delivers the records of another kind in the same way. Do not mix kinds in one follower: it
   // remembers one position.

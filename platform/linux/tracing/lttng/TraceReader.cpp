@@ -190,7 +190,7 @@ class TraceGraph {
     const auto* const filter =
         bt_plugin_borrow_filter_component_class_by_name_const(utils_.get(), "muxer");
     if (filter == nullptr) return false;
-    // Without a level of its own, the library would write to standard error.
+    // Set the log level to none: by default the library writes to standard error.
     if (bt_graph_add_filter_component(graph_.get(), filter, "muxer", nullptr, BT_LOGGING_LEVEL_NONE,
                                       &muxer_) != BT_GRAPH_ADD_COMPONENT_STATUS_OK) {
       return false;
