@@ -1,4 +1,9 @@
+#include <cstdio>
+#include <filesystem>
+#include <memory>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/testing/FileSizeLimit.h"
@@ -212,14 +217,20 @@ TEST_F(SqliteStoreFailureTest, SetsAsideAFileThatIsDestroyedWhileItRunsAndContin
   };
   for (int number = 0; number < 10'000; ++number) sendLong();
   ASSERT_TRUE(allIsStored());
-  // Overwrite the database and its log in place, as a failing disk or a stray program would.
+  // Overwrite the database and its log in place, as a failing disk or a stray program would. Open
+  // both first: the store may set them aside as soon as one of them is destroyed.
+  using File = std::unique_ptr<std::FILE, int (*)(std::FILE*)>;
+  std::vector<std::pair<File, std::size_t>> files;
   for (const char* suffix : {"", "-wal"}) {
     const std::string path = database().native() + suffix;
-    std::FILE* file = std::fopen(path.c_str(), "r+");
-    ASSERT_NE(file, nullptr);
-    const std::string garbage(std::filesystem::file_size(path), '\x33');
-    ASSERT_EQ(std::fwrite(garbage.data(), 1, garbage.size(), file), garbage.size());
-    ASSERT_EQ(std::fclose(file), 0);
+    files.emplace_back(File(std::fopen(path.c_str(), "r+"), &std::fclose),
+                       std::filesystem::file_size(path));
+    ASSERT_NE(files.back().first, nullptr) << path;
+  }
+  for (auto& [file, size] : files) {
+    const std::string garbage(size, '\x33');
+    ASSERT_EQ(std::fwrite(garbage.data(), 1, garbage.size(), file.get()), garbage.size());
+    ASSERT_EQ(std::fflush(file.get()), 0);
   }
   EXPECT_TRUE(eventually([&] {
     sendLong();
