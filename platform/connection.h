@@ -111,9 +111,9 @@ struct NSXPCInterface {
 //   made --resume--> open --> invalidated
 //                     └--> interrupted --> open or invalidated
 //
-// Shared by the service that made it and by code that holds it for an answer. Handlers and requests
-// run on the connection's thread, one at a time. Every failure on the wire ends in the invalidation
-// handler; no call here fails.
+// Shared by the service that made it and by code that needs it to answer a request. Handlers and
+// requests run on the connection's thread, one at a time. Every failure on the wire ends in the
+// invalidation handler; no call here fails.
 class NSXPCConnection {
  public:
   virtual ~NSXPCConnection() = default;

@@ -77,8 +77,8 @@ class InotifyNotifyService final : public NotifyService {
   [[nodiscard]] std::optional<Clock::time_point> nextWork() const;
 
   const ObjectLog log_;
-  // The directories that are always watched. In the list for `watch_` the directories of `linked_`
-  // and then those of `notifyLinks_` follow.
+  // The directories that are always watched. The list for `watch_` has these first, then the
+  // directories of `linked_`, then those of `notifyLinks_`.
   const std::vector<std::filesystem::path> directories_;
   DirectoryWatch watch_;
   std::vector<LinkedSetting> linked_;               // of the preference files, as watched

@@ -9,7 +9,7 @@ namespace halvox::platform::linux_ {
 enum class StoreError : std::uint8_t {
   kDirectory,     // the directory or a file in it cannot be created or written to
   kInUse,         // another service writes to this store
-  kNewerVersion,  // a newer version of the program made the store, which was not touched
+  kNewerVersion,  // a newer version made the store; it was left unchanged
   kMissing,       // there is no store (readers only)
   kDamaged,       // the file is not a database, or a broken one
   kCannotOpen,    // any other error of the system or of SQLite

@@ -37,7 +37,7 @@ struct PowerEventRecord {
   std::size_t bind(Statement& statement, int firstColumn, PayloadEncoder& encoder) const;
 };
 
-// The sender of link messages. All messages of one session share one.
+// The sender of link messages. All messages of one session share one object.
 struct LinkParty {
   std::int64_t sessionID = 0;
   std::string clientName;

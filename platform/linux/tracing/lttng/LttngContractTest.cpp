@@ -1,8 +1,8 @@
 // The contracts of kernel traces and performance traces, run on LTTng.
 //
-// The program never runs as root, because root's tracer is the machine's own; it has a session
-// daemon of its own. It is also the program whose events are recorded: with --emit it emits events
-// and ends.
+// The program never runs as root, because root's tracer belongs to the whole machine. It starts a
+// session daemon of its own. It is also the program whose events are recorded: with --emit it emits
+// events and ends.
 
 #include <csignal>
 #include <cstdio>
@@ -199,8 +199,8 @@ bool hasProgram(const std::string& name) {
 
 }  // namespace
 
-// AddressSanitizer calls this. LTTng's own thread holds memory when the program ends, which we
-// cannot free.
+// AddressSanitizer calls this. LTTng's thread still holds memory when the program ends, and we
+// cannot free it.
 extern "C" const char* __lsan_default_suppressions() { return "leak:/liblttng-ust.so.1\n"; }
 
 int main(int count, char** arguments) {

@@ -190,7 +190,7 @@ void LttngControl::discard(const Recording& recording) {
 
 void LttngControl::close() {
   const MutexLock lock(mutex_);
-  // Without a recording and a daemon of ours there is nothing to destroy.
+  // If nothing was recorded and the daemon is not ours, there is nothing to destroy.
   if (begun_ == 0 && !daemon_.isOurs()) return;
   if (daemon_.isOurs()) {
     daemon_.leave();
