@@ -56,7 +56,7 @@ TEST(FlowControlTest, WaitingIsRefusedWhenThereIsRoom) {
   EXPECT_FALSE(flow.wait());
 }
 
-// The later one of the wait and the last close must see the earlier one.
+// A wait must see an earlier last close, and a last close must see an earlier wait.
 TEST(FlowControlTest, NoWakeUpIsLostBetweenThreads) {
   for (int round = 0; round < 20'000; ++round) {
     FlowControl flow;

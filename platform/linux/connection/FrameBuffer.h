@@ -60,7 +60,7 @@ class FrameBuffer {
   // Moves the remaining bytes out of the scratch, and frees storage that is not needed any more.
   void settle();
 
-  // Adds bytes from elsewhere. Not between readInto() and settle().
+  // Adds bytes that were received elsewhere. Must not be called between readInto() and settle().
   void append(std::span<const std::byte> bytes);
 
   // All unused bytes, whether or not they are a frame.

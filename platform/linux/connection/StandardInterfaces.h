@@ -26,7 +26,7 @@ struct StandardAnswer {
   std::string errorText{};
 };
 
-// One call of a standard method. Everything in it is valid during the call only.
+// One call of a standard method. Everything in it is valid only during the call.
 struct StandardRequest {
   ClientConnection& client;
   std::string_view path;

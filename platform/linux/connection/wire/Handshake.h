@@ -63,7 +63,7 @@ class ServerHandshake {
   ServerHandshake(std::string guidHex, uid_t peerUid);
 
   // Takes input in pieces of any size, and appends the answers to `output`. Takes nothing more
-  // after it is done or has failed.
+  // after the handshake is done or has failed.
   HandshakeProgress feed(std::span<const std::byte> input, std::string& output);
 
  private:

@@ -30,10 +30,10 @@ struct DecodeError {
   std::string message;
 };
 
-// The elements of containers that are being decoded, innermost last. Arrays and dictionaries have
-// their final size when they are made, which is known only after their last element: without this,
-// a container would be allocated twice. A caller that decodes many bodies keeps one, and its
-// capacity, for all of them. Belongs to one thread. Empty between calls.
+// The elements of containers that are being decoded, innermost last. Arrays and dictionaries are
+// made with their final size, which is known only after their last element. Without this scratch,
+// each container would be allocated twice. A caller that decodes many bodies keeps one scratch,
+// with its capacity, for all of them. Belongs to one thread. Empty between calls.
 struct DecodeScratch {
   struct Entry {
     Entry(std::string_view text, Value content) : key(text), value(std::move(content)) {}

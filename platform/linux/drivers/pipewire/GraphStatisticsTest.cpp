@@ -24,7 +24,7 @@ using ::testing::StartsWith;
 
 class GraphStatisticsTest : public ::testing::Test {
  protected:
-  // Returns those channels as lines that begin with this text.
+  // Returns the channels as lines, but only the lines that begin with `start`.
   std::vector<std::string> read(std::string_view start = "") {
     graph.addTo(maker, now);
     std::vector<std::string> lines = describe(testing::samplesOf(maker.finish()));
