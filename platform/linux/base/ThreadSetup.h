@@ -19,7 +19,7 @@ enum class ThreadPriority : std::uint8_t {
 void setUpThread(std::string_view label);
 
 // Does the same, and lowers the priority of the calling thread, which cannot raise it again. Work
-// that must be fast may not wait for such a thread.
+// that must be fast must not wait for such a thread.
 void setUpThread(std::string_view label, ThreadPriority priority);
 
 // Blocks all signals for the calling thread while this object exists. A new thread inherits the

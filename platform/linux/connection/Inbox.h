@@ -39,10 +39,10 @@ struct Mail {
 //   awake --trySleep()--> asleep --the first post writes to the eventfd--> awake ... --close()-->
 //   closed: drops what is posted
 //
-// A post while the I/O thread is awake costs a lock and no system call: it reads its mail at the
-// end of every turn. Only the first post while it sleeps wakes it. Shared by the service and by
-// replies and requests, which may outlive it. The number of letters is bounded: at most one reply
-// for each open request and one notice of room for each client.
+// While the I/O thread is awake, a post costs a lock but no system call: the thread reads its mail
+// at the end of every turn. While the thread sleeps, only the first post wakes it. Shared by the
+// service and by replies and requests, which may outlive it. The number of letters is bounded: at
+// most one reply for each open request and one notice of room for each client.
 class Inbox final : public EventSource {
  public:
   Inbox();

@@ -197,7 +197,7 @@ TEST_F(AlsaSourceTest, ACardThatIsPluggedInAgainIsAnother) {
   EXPECT_THAT(show(), Contains("Scarlet Two/Tx/USB Audio/frames frames = 480"));
 }
 
-// A dangling link is in its directory and cannot be opened.
+// A dangling link is listed in its directory but cannot be opened.
 TEST_F(AlsaSourceTest, WhatVanishesAfterItsDirectoryWasListedIsSkipped) {
   use("analogue");
   const auto asound = root_.path() / "proc/asound";

@@ -72,7 +72,7 @@ class NodeStatistics {
   void cycleEnded(const pipewire::ProfiledNode& node);
   void xrunsHappened(std::uint32_t count) { xruns_ += count; }
   void stateChanged(std::optional<NodeState> state, Time now) { states_.change(state, now); }
-  // The node has disappeared. Its counts continue if a node of its name appears.
+  // The node has disappeared. Its counts continue if a node of the same name appears.
   void left(Time now) { states_.leave(now); }
   void addTo(ReadingMaker& maker, Time now) const;
   [[nodiscard]] const std::string& driverName() const { return *cyclesChannel_->driverName; }

@@ -67,7 +67,7 @@ TEST(PipeWireDriverSourceAloneTest, OnlyTheConnectionsAreThereAndOpeningDoesNotW
   FakePlatform platform;
   const ScratchDirectory directory;
   setenv("XDG_RUNTIME_DIR", directory.path().c_str(), 1);
-  // If it waited, the test would take this long.
+  // If open() waited, the test would take this long.
   PipeWireDriverSource source(driversCategory(platform.log), {.longestOpening = 1h});
   const auto start = Clock::now();
 
