@@ -167,7 +167,7 @@ TEST_F(WholeFileTest, FollowsLinksUnlessTheyAreRefused) {
 }
 
 TEST_F(WholeFileTest, ReportsAnErrorOfReading) {
-  // The kernel opens this file, but reads nothing from address 0.
+  // The kernel allows opening this file, but a read at address 0 fails.
   const FileContent content = readWholeFile({.path = "/proc/self/mem", .most = 10});
 
   EXPECT_EQ(content.outcome, Outcome::kFailed);

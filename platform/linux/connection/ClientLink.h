@@ -30,12 +30,12 @@ class ClientLink : public std::enable_shared_from_this<ClientLink> {
   [[nodiscard]] Inbox& inbox() { return *inbox_; }
   [[nodiscard]] ConnectionStatistics& statistics() { return *statistics_; }
 
-  // A request has been carried out. Any thread.
+  // A request has been carried out. Any thread may call it.
   void requestDone(FlowControl::Cost cost) {
     if (flow_.close(cost)) inbox_->postRoom(shared_from_this());
   }
 
-  // The connection, or null after it has finished. I/O thread only.
+  // Returns the connection, or null after it has finished. Only for the I/O thread.
   [[nodiscard]] ClientConnection* connection() const { return connection_; }
   void attach(ClientConnection& connection) { connection_ = &connection; }
   void detach() { connection_ = nullptr; }
@@ -70,11 +70,11 @@ class ReplyTicket {
   ReplyTicket(std::shared_ptr<ClientLink> client, std::uint32_t serial, std::string_view signature)
       : client_(std::move(client)), serial_(serial), signature_(signature) {}
 
-  // Any thread. On the I/O thread, where helped jobs run, the reply is encoded at once and written
-  // at the end of the turn. Other threads post it to the I/O thread.
+  // Any thread may call it. On the I/O thread, where helped jobs run, the reply is encoded at once
+  // and written at the end of the turn. Other threads post it to the I/O thread.
   static void answer(const std::shared_ptr<ReplyTicket>& ticket, const std::optional<Error>& error,
                      const Value& value);
-  // Hands the reply to the connection, unless that has finished. I/O thread only.
+  // Hands the reply to the connection, unless that has finished. Only for the I/O thread.
   void deliver(const Error* error, const Value& value);
 
  private:

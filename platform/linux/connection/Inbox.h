@@ -49,7 +49,7 @@ class Inbox final : public EventSource {
   // Returns false if the system has no descriptor left.
   [[nodiscard]] bool watchWith(EventLoop& loop);
 
-  // From any thread.
+  // Any thread may call these functions.
   void postReply(PostedReply reply);
   void postRoom(std::shared_ptr<ClientLink> client);
   void postRelief();
@@ -57,7 +57,7 @@ class Inbox final : public EventSource {
   // Returns true on the thread that runs the loop.
   [[nodiscard]] bool isLoopThread() const;
 
-  // On the I/O thread.
+  // Only the I/O thread may call the following functions.
   void attachToThisThread();
   void close();
   // Announces that the loop is about to sleep. Returns false if there is mail: the loop must then

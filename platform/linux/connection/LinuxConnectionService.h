@@ -100,13 +100,13 @@ class LinuxConnectionService final : public ConnectionService {
   ~LinuxConnectionService() override;
 
   // Makes the socket, or takes the sockets of socket activation, and joins the buses. Replaces a
-  // socket file that no process serves any more. Waits at most 5 seconds for each bus. Raises the
-  // process's limit of descriptors to the hard limit.
+  // socket file on which no process listens any more. Waits at most 5 seconds for each bus. Raises
+  // the process's limit of descriptors to the hard limit.
   Result<void, ConnectionOpenError> open();
 
   NSXPCListener& serviceListener() override;
 
-  // Makes resume() return at the end of its turn. Any thread.
+  // Makes resume() return at the end of its turn. Any thread may call it.
   void requestStop();
 
  private:

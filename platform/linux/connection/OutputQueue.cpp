@@ -56,7 +56,7 @@ OutputQueue::Flush OutputQueue::flush(int fd, std::size_t& sentBytes, std::size_
     clear();
     return Flush::kEmpty;
   }
-  // Without MSG_NOSIGNAL, a client that leaves would end the service by SIGPIPE.
+  // Without MSG_NOSIGNAL, a client that disconnects would end the service with SIGPIPE.
   const ssize_t count = send(fd, buffer_->bytes.data() + buffer_->sentBytes, unsentBytes(),
                              MSG_NOSIGNAL | MSG_DONTWAIT);
   if (count < 0) {

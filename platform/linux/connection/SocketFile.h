@@ -37,8 +37,8 @@ struct BoundSocket {
 };
 
 // Makes the socket at `path`. Users that `access` excludes can never connect, not even while the
-// socket is being made. Replaces a socket file that no process serves any more, and never any other
-// file. Blocks for one connect() and one look-up of the group.
+// socket is being made. Replaces a socket file on which no process listens any more, and never any
+// other file. Blocks for one connect() and one look-up of the group.
 Result<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
                                                   const SocketAccess& access = {});
 

@@ -71,7 +71,7 @@ void PoolThreads::join() {
 }
 
 void PoolThreads::discardJobs() {
-  // Without work to wait for, poll() returns when the run queue is empty.
+  // Remove the work guard: poll() then returns when the run queue is empty.
   work_.reset();
   // A context that was stopped runs nothing.
   context_.restart();

@@ -61,7 +61,7 @@ std::vector<std::string> pcmStates() { return {kPcmStates.begin(), kPcmStates.en
 
 std::shared_ptr<const Reading> AlsaSource::read() {
   ++round_;
-  // Once for all channels, so that their times can be compared.
+  // Read the clock once for all channels: their times can then be compared.
   time_ = now_();
   const UniqueFd asound = openDirectory((root_ / "proc/asound").c_str());
   if (asound) {

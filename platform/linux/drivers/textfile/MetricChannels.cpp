@@ -255,7 +255,7 @@ void ChannelMaker::addStates(const MetricFamily& family) {
   }
 }
 
-// The value of the counter for a state: the sample that has the state's labels.
+// Returns the counter's value for a state, from the sample that has the state's labels.
 std::uint64_t ChannelMaker::stateCount(const MetricFamily& counter, const MetricSample& state) {
   const auto [found, isNew] = counts_.try_emplace(&counter);
   if (isNew) {
