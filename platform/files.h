@@ -12,7 +12,7 @@
 namespace halvox::platform {
 
 // One file of indented JSON text that is written piece by piece. It appears under its name when it
-// is complete, or not at all. A reader therefore never sees half a summary.
+// is complete, or not at all. A reader therefore never sees an incomplete summary.
 //
 // The caller owns it and uses it on one thread. Destroying it before commit() removes what was
 // written. Writing in pieces avoids a second copy of a large history in memory.

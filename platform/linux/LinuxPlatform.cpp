@@ -100,9 +100,8 @@ bool LinuxPlatform::close() {
   // Stop traces before the queues: a stop of a session may wait for a trace that is still being
   // read.
   adapters_->traces->stop();
-  // A message that was answered without an error must reach the link, and its queue may still hold
-  // it. These queues have a lower priority than requests, and some of their jobs may not have run
-  // yet.
+  // A message that was answered without an error must reach the link. The queue of its session may
+  // still hold it, because these queues have a lower priority than requests.
   adapters_->dispatch.finish(kQueuesFinishWithin);
   const bool ended = adapters_->dispatch.stop(kJobsEndWithin);
   ended ? adapters_->traces->close() : adapters_->traces->abandon();

@@ -25,7 +25,7 @@ struct ProfiledCycle {
   std::optional<ProfiledNode> driver{};
   // The nodes that follow the driver and whose turn it was.
   std::vector<ProfiledNode> followers{};
-  // Those of them that had not finished when the cycle ended.
+  // The followers that had not finished when the cycle ended.
   std::vector<std::uint32_t> late{};
   friend bool operator==(const ProfiledCycle&, const ProfiledCycle&) = default;
 };

@@ -24,7 +24,7 @@ constexpr std::size_t kKeptBufferBytes = 256 * 1024;
 // The shortest form of a double has at most 24 characters, an integer of 64 bits at most 20.
 constexpr std::size_t kLongestNumber = 32;
 
-// RFC 3339 has four digits for the year. Both in seconds since 1970.
+// RFC 3339 has four digits for the year. Both bounds are in seconds since 1970.
 constexpr double kEarliest = -62135596800.0;  // 0001-01-01
 constexpr double kEnd = 253402300800.0;       // 10000-01-01
 

@@ -140,8 +140,8 @@ SqliteCode RecordSpans::deleteOlderThan(double time, bool& found) {
   code = statements_.deleteAgedRecords.run();
   if (code != SQLITE_OK) return code;
   // Raise the span's first time to the limit, or the next call would find the same span again. If
-  // the true first time is later, a future call examines the span once without need. The row is
-  // deleted together with the records after it.
+  // the true first time is later, a future call examines the span once without need. deleteOldest()
+  // deletes the row when it deletes later records.
   statements_.shortenSpan.bind(1, span);
   statements_.shortenSpan.bind(2, time);
   return statements_.shortenSpan.run();

@@ -91,7 +91,7 @@ void NatsPublisher::abandonAll() {
 
 void NatsPublisher::attach(jsCtx* context, std::chrono::nanoseconds duplicates) {
   context_ = context;
-  // A stream that others made may recognise identifiers for a shorter time than ours do.
+  // A stream that others made may recognise identifiers for a shorter time than our streams do.
   ackTime_ = std::min<std::chrono::nanoseconds>(kAckTime, duplicates / 2);
 }
 

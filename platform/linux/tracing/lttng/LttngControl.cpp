@@ -32,7 +32,7 @@ constexpr std::uint64_t kFewestSubBuffers = 4;
 constexpr std::uint64_t kMostBytesOfAll = 256U << 20U;
 
 // The tracer allocates buffers for every processor that the machine may ever have. On large
-// machines each gets fewer, so that all of them together stay within 256 MiB.
+// machines each processor gets fewer buffers, so that all buffers together stay within 256 MiB.
 std::uint64_t subBuffers() {
   const auto processors = static_cast<std::uint64_t>(std::max(1L, ::sysconf(_SC_NPROCESSORS_CONF)));
   const std::uint64_t share = kMostBytesOfAll / kSubBufferBytes / processors;

@@ -23,7 +23,7 @@ namespace halvox::platform::linux_ {
 class SessionDaemon {
  public:
   struct Limits {
-    // A daemon takes about 0.4 s to start; the rest is for a busy machine.
+    // A daemon takes about 0.4 s to start; the rest is a reserve for a busy machine.
     std::chrono::milliseconds answersWithin{10'000};
     std::chrono::milliseconds endsWithin{5'000};  // after SIGTERM; then it is killed
   };

@@ -49,8 +49,8 @@ Result<void> copy(archive* to, int file, std::uint64_t size, const std::filesyst
   return {};
 }
 
-// O_NOFOLLOW and the check for a regular file keep anything out of the archive that is not part of
-// the recording.
+// With O_NOFOLLOW and the check for a regular file, the archive contains only files of the
+// recording.
 Result<void> addFile(archive* to, const std::filesystem::path& path, const std::string& name) {
   const UniqueFd file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK));
   struct stat status {};
