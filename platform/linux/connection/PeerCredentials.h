@@ -6,7 +6,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The number that the kernel never gives to a user.
+// A user ID that the kernel never assigns.
 inline constexpr uid_t kUnknownUser = static_cast<uid_t>(-1);
 
 // The process and user at the other end of a connection, as the kernel or the bus reports them.

@@ -10,7 +10,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Counts a queue as having a turn while this object lives.
+// Counts a queue as having a turn while this object exists.
 class AtWork {
  public:
   explicit AtWork(QueueLabel& label) : label_(label) {

@@ -12,7 +12,8 @@ namespace halvox::platform::linux_::dbus {
 // Limits of D-Bus. Connections set a lower limit for frames.
 inline constexpr std::size_t kMaxMessageBytes = std::size_t{128} * 1024 * 1024;
 inline constexpr std::size_t kMaxArrayBytes = std::size_t{64} * 1024 * 1024;
-// Arrays, structs and variants inside each other. Dictionary entries do not count as a level.
+// The most levels of arrays, structs and variants inside each other. A dictionary entry does not
+// count as a level.
 inline constexpr unsigned kMaxNesting = 64;
 
 // The fixed part of a header and the length of its field array: what measureFrame() needs.

@@ -69,7 +69,7 @@ class TypeScanner {
   // A date is the only supported struct.
   bool scanStruct(unsigned arrays, unsigned structs) {
     if (text_.substr(position_, 2) != "d)") unsupported_ = true;
-    // At least one member: D-Bus has no empty structs.
+    // Scan at least one member: D-Bus has no empty structs.
     do {
       if (!scanType(arrays, structs)) return false;
     } while (!atEnd() && peek() != ')');

@@ -64,14 +64,14 @@ class WireReader {
     if (!readUncheckedText(text)) return false;
     return isUtf8WithoutNul(text) || fail("the text is not valid UTF-8 or contains a NUL");
   }
-  // A text without a check of its characters, for callers with a stricter rule.
+  // Reads a text without checking its characters, for callers with a stricter rule.
   bool readUncheckedText(std::string_view& text) {
     std::uint32_t length = 0;
     return read(length) && takeTerminated(length, text);
   }
   bool readPath(std::string_view& path);
   bool readSignature(std::string_view& signature);
-  // The signature of a variant, without a check of its grammar.
+  // Reads the signature of a variant without checking its grammar.
   bool readVariantSignature(std::string_view& signature) {
     std::uint8_t length = 0;
     return read(length) && takeTerminated(length, signature);
