@@ -143,10 +143,10 @@ class HalvoxClient {
   [[nodiscard]] std::string socketPath() const;
   [[nodiscard]] Counters counters() const;
   // Sets the function to call when the connection is made (true) or lost (false). If there is a
-  // connection already, it is called soon with true. An empty function removes the handler. The
-  // handler runs on the client's thread, which sends nothing meanwhile; it must not block or
-  // destroy the client. A call that is running while the handler is replaced may end after this
-  // function has returned. No call comes after the client's destruction.
+  // connection already, the function is called soon with true. An empty function removes the
+  // handler. The handler runs on the client's thread, which sends nothing meanwhile; it must not
+  // block or destroy the client. A call that is running while the handler is replaced may end after
+  // this function has returned. No call comes after the client's destruction.
   void setConnectionHandler(std::function<void(bool connected)> handler);
 
  private:

@@ -98,7 +98,7 @@ struct NextFrame {
 };
 
 // Looks at the first frame. The plain answers of the service are recognised by their first bytes;
-// any other header is read and checked. Bodies are not looked at.
+// any other header is read and checked. Bodies are not read.
 NextFrame nextFrame(std::span<const std::byte> input);
 
 }  // namespace halvox::client

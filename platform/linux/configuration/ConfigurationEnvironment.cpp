@@ -14,7 +14,7 @@ std::optional<std::filesystem::path> environmentPath(const char* variable) {
   const std::string_view list(value);
   // systemd separates the directories of a unit by colons. The first one is ours.
   std::filesystem::path path(list.substr(0, list.find(':')));
-  // The XDG rules say that a relative path is to be ignored.
+  // The XDG rules say that relative paths must be ignored.
   if (!path.is_absolute()) return std::nullopt;
   return path;
 }

@@ -54,7 +54,8 @@ struct ConnectionOptions {
   EndSignals signals = EndSignals::kHandle;
   // Called on the I/O thread: before the first delivery of a turn, after the last one, and after
   // the replies of the turn have been written. Replies given on this thread during `endBatch` are
-  // among them. They connect the loop to the queues, about which the loop itself knows nothing.
+  // among those. The functions connect the loop to the queues, about which the loop itself knows
+  // nothing.
   std::function<void()> beginBatch;
   std::function<void()> endBatch;
   std::function<void()> afterReplies;

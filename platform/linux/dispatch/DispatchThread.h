@@ -31,7 +31,7 @@ class DispatchThread {
   DispatchThread& operator=(const DispatchThread&) = delete;
   ~DispatchThread();
 
-  // Marks the calling thread as working for `queue` (null: for none) while this object lives. May
+  // Marks the calling thread as working for `queue` (null: for none) while this object exists. May
   // be nested.
   class Working {
    public:

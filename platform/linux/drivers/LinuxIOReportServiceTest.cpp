@@ -242,7 +242,8 @@ TEST_F(LinuxIOReportServiceTest, NobodyWaitsAgainForALateSourceAndItIsLoggedOnce
   longestWait_ = SourceReader::kLongestWait;
   const auto found = serveLateSource();
 
-  // If they waited again, each of them would be slow. A busy machine makes only some of them slow.
+  // If the samples waited again, each of them would be slow. A busy machine delays only some of
+  // them.
   constexpr int kRounds = 20;
   int slowRounds = 0;
   for (int round = 0; round < kRounds; ++round) {

@@ -17,7 +17,7 @@ namespace halvox::platform::linux_ {
 //
 // Any thread may use it. Blocks on the disk.
 struct RootedDirectory {
-  // A path that is absolute to the callers and lies below `root` in the file system.
+  // A path that callers see as absolute, and that lies below `root` in the file system.
   struct Place {
     const std::filesystem::path& root;
     std::string_view path;

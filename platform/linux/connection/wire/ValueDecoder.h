@@ -61,7 +61,7 @@ struct DecodeScratch {
 // Everything else is unsupported: file descriptors, other structs, dictionaries with other keys
 // (even an empty array of these), and nesting of more than kMaxNesting levels.
 //
-// Time and memory are at worst proportional to the size of the frame. Allocates the values only,
+// Time and memory are at worst proportional to the size of the frame. Allocates only the values,
 // once `arguments` and `scratch` have their capacity. Any thread may call it.
 [[nodiscard]] std::optional<DecodeError> decodeBody(const Frame& frame,
                                                     std::string_view expectedSignature,

@@ -129,8 +129,7 @@ void GraphFollower::proceed() {
   // Disable the timer: it would cause a second attempt.
   proceedAfter(std::nullopt);
   const bool isWanted = isLeased();
-  // Do this first: until it is disconnected, everything below would use the connection that has
-  // ended.
+  // Disconnect first: everything below would otherwise use the connection that has ended.
   if (std::exchange(isLost_, false)) {
     disconnect();
     if (isWanted) {
