@@ -83,8 +83,8 @@ std::optional<Error> NatsLink::refusal(std::size_t bytes) {
     return refusedByLink("the message has " + std::to_string(bytes) +
                          " bytes; the NATS server accepts at most " + std::to_string(maxPayload_));
   }
-  // The attempt that just failed decides about this message, too: the sender gets the error at
-  // once, not after another time-out.
+  // Refuse the message if an attempt has just failed: the sender gets the error at once, not after
+  // another time-out.
   if (state_ == State::kIdle && !lastFailure_.empty() &&
       std::chrono::steady_clock::now() < nextAttempt_) {
     return refusedByLink("cannot connect to a NATS server: " + lastFailure_);

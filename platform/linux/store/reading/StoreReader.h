@@ -89,7 +89,7 @@ class StoreReader {
                                          const RecordCallback& callback);
 
   // The last record that the last complete reading looked at, whether the filter let it through or
-  // not. A reading after it misses no record.
+  // not. A reading that continues after it misses no record.
   [[nodiscard]] StoredRecordID lastRead() const { return lastRead_; }
 
   // Returns true when no store is open, or the path now leads to another database or to none. Call

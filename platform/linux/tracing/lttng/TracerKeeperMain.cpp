@@ -127,7 +127,8 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
 int main(int count, char** arguments) {
   const std::vector<std::string> words(arguments, arguments + count);
   if ((words.size() != 3 && words.size() != 5) || words[2].empty()) return EXIT_FAILURE;
-  // Nobody calls wait() for the daemon. With SIGCHLD ignored, the kernel removes it when it ends.
+  // The keeper never calls wait() for the daemon. With SIGCHLD ignored, the kernel removes the
+  // daemon when it ends.
   std::signal(SIGCHLD, SIG_IGN);
   std::signal(SIGPIPE, SIG_IGN);
   std::optional<DaemonProcess> daemon;
