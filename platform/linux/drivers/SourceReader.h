@@ -48,7 +48,7 @@ class SourceReader {
   // before everything else.
   void startOpening();
   void waitUntilOpen();
-  // A request for a reading. The thread that asked passes it to take(), once.
+  // A request for a reading. The requesting thread passes it to take(), once.
   struct Asked {
     std::uint64_t number = 0;  // of the first reading that is new enough
     bool isWaiting = false;

@@ -12,8 +12,8 @@ namespace {
 using Kind = DecodeError::Kind;
 
 // More elements than ordinary messages have in all containers that are open at a time. With a
-// smaller bound, such messages would allocate the scratch again each time. Without one, the largest
-// message would hold its memory for the life of the service.
+// smaller bound, such messages would allocate the scratch again each time. Without a bound, the
+// largest message would hold its memory until the service ends.
 constexpr std::size_t kKeptElements = 1024;
 
 // Decodes the values of one body. `type` is always one valid, complete type: the signatures of

@@ -14,11 +14,11 @@ namespace halvox::platform::linux_ {
 // Calls back on the loop's thread when a file appears under the name of the PipeWire server's
 // socket.
 //
-// The environment at construction decides where the socket is, by the library's own rules. It
-// watches only between begin() and end(), with inotify instead of a timer, and waiting for a server
-// therefore costs nothing. Belongs to the loop's thread, or to a caller that knows that this thread
-// does not run. GraphFollower owns it. Without the directory, or without inotify, it never calls
-// back.
+// The environment at construction decides where the socket is, by the library's own rules. This
+// class watches only between begin() and end(). It uses inotify instead of a timer: waiting for a
+// server then costs nothing. Belongs to the loop's thread, or to a caller that knows that this
+// thread does not run. GraphFollower owns it. Without the directory, or without inotify, it never
+// calls back.
 class ServerWatch {
  public:
   // `onAppeared` may call end().
