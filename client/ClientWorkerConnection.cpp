@@ -145,7 +145,7 @@ void ClientWorker::sendAll() {
   }
   ring_.release();
   if (ring_.head() != before) lastMessage_ = std::chrono::steady_clock::now();
-  // A failure shows when the worker next looks at the connection.
+  // The worker notices a failure when it next looks at the connection.
   if (stream_.isOpen()) stream_.send();
 }
 

@@ -17,7 +17,7 @@ std::string_view groupOf(std::string_view mediaClass) {
   return {};
 }
 
-// The first kLongestName bytes at most, cut between characters.
+// Returns at most the first kLongestName bytes, cut between characters.
 std::string cleanName(std::string_view name) {
   std::size_t length = 0;
   while (length < name.size()) {
