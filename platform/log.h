@@ -85,7 +85,7 @@ std::string logPrefix(std::string_view unit, std::uint32_t line);
 //   kLog.info("found reporting session ", id);
 //
 // The text and its parts are joined as they are. Parts are texts, integers, values, and objects
-// with a description(); none is formatted unless the line is wanted. Each unit has one as a
+// with a description(); none is formatted unless the line is wanted. Each unit has one UnitLog as a
 // constant and uses it from any thread.
 class UnitLog {
  public:
@@ -96,7 +96,7 @@ class UnitLog {
   // The first part of a line. It also carries the line number of the call.
   struct Text {
     // std::source_location does the same, but the standard library of clang 14 does not have it.
-    // Implicit: call sites read as plain text.
+    // The constructor is implicit, so that call sites read as plain text.
     Text(const char* first, std::uint32_t where = __builtin_LINE()) : text(first), line(where) {}
     const char* text;
     std::uint32_t line;

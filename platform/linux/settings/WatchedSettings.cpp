@@ -41,8 +41,8 @@ WatchedSettings::WatchedSettings(std::filesystem::path notifyDirectory,
 
 std::optional<FileMark> WatchedSettings::mark(const std::string& name) const {
   struct stat status {};
-  // lstat, because replacing a link is also a change. The time of the last status change, because
-  // `touch -d` can set the other times.
+  // Use lstat, because replacing a link is also a change. Use the time of the last status change,
+  // because `touch -d` can set the other times.
   if (::lstat((notifyDirectory_ / name).c_str(), &status) != 0) return std::nullopt;
   return FileMark{status.st_ino, status.st_ctim.tv_sec * kNanoseconds + status.st_ctim.tv_nsec};
 }

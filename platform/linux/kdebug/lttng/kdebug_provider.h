@@ -11,7 +11,7 @@
 #include <lttng/tracepoint.h>
 #include <stdint.h>
 
-// The macros are laid out as a record.
+// Each line has one field; the formatter would join the lines.
 /* clang-format off */
 LTTNG_UST_TRACEPOINT_EVENT(
     halvox, kdebug,

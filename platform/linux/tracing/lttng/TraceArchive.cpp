@@ -78,7 +78,7 @@ Result<void> write(const std::filesystem::path& directory, int file) {
   std::filesystem::recursive_directory_iterator entry(directory, error);
   for (; !error && entry != std::filesystem::recursive_directory_iterator();
        entry.increment(error)) {
-    // Directories are made by unpacking the files in them.
+    // Unpacking a file also makes its directories.
     if (entry->is_directory()) continue;
     const std::filesystem::path name =
         directory.filename() / entry->path().lexically_relative(directory);
