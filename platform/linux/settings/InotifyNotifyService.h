@@ -18,7 +18,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Returned for a name that a file cannot have, and for every other failure.
+// kNotifyInvalidName is for a name that a file cannot have, kNotifyFailed for every other failure.
 inline constexpr NotifyStatus kNotifyInvalidName = 1;
 inline constexpr NotifyStatus kNotifyFailed = 1'000'000;
 

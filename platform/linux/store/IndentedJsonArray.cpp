@@ -48,8 +48,8 @@ class IndentedJsonArray::Text {
   }
 
  private:
-  // Does not put the key into a Dictionary: Key shares its texts in a bounded table, which keys
-  // that differ each time would fill for the life of the process.
+  // Does not put the key into a Dictionary, because Key shares its texts in a bounded table. Keys
+  // that differ each time would fill that table for the life of the process.
   void appendKey(std::string_view key) {
     key_.Clear();
     rapidjson::Writer<rapidjson::StringBuffer> writer(key_);

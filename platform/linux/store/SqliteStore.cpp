@@ -238,7 +238,7 @@ void SqliteStore::onStored() {
 
 void SqliteStore::fail(SqliteCode code, std::string_view what) {
   // Read the errors first: every other call replaces them. After a failed commit SQLite does not
-  // return the system's error. Then take errno, which writeTransaction() cleared.
+  // return the system's error. In that case take errno, which writeTransaction() cleared.
   const int lastError = errno;
   const int systemError = database_.systemError() != 0 ? database_.systemError() : lastError;
   const DropReason reason = reasonOf(code, systemError);
