@@ -58,8 +58,8 @@ class DispatchPool {
   // Waits for the end of the threads, at most until `deadline`. Returns false if a job still runs
   // then. Call after stop().
   bool waitForEnd(std::chrono::steady_clock::time_point deadline);
-  // Destroys the discarded jobs and waits. Needed because they may hold queues, which hold the
-  // pool. Call after waitForEnd() has returned true.
+  // Destroys the discarded jobs and the discarded waits. Needed because both may hold queues, which
+  // hold the pool. Call after waitForEnd() has returned true.
   void discardJobs();
 
  private:

@@ -95,7 +95,7 @@ class SourceReader {
   std::uint64_t lastMade_ HALVOX_GUARDED_BY(mutex_) = 0;
   int waiting_ HALVOX_GUARDED_BY(mutex_) = 0;
   bool isSampleWanted_ HALVOX_GUARDED_BY(mutex_) = false;
-  // The latest reading. Kept only while someone waits, because a source may look at whether its
+  // The latest reading. Kept only while a thread waits, because a source may check whether its
   // readings are still held.
   ReadingPointer handedOver_ HALVOX_GUARDED_BY(mutex_);
   std::thread thread_;
