@@ -35,8 +35,8 @@ Result<UniqueFd> connectTo(const BusSocket& bus) {
   const std::size_t start = bus.space == BusSocket::Space::kAbstract ? 1 : 0;
   if (bus.name.size() + start >= sizeof address.sun_path) return failure(ENAMETOOLONG);
   std::memcpy(&address.sun_path[start], bus.name.data(), bus.name.size());
-  // The length marks the end of an abstract name; a file path ends with a NUL. Either way it takes
-  // one byte more than the name.
+  // The length marks the end of an abstract name; a file path ends with a NUL. Either way the
+  // address takes one byte more than the name.
   const std::size_t length = offsetof(sockaddr_un, sun_path) + bus.name.size() + 1;
   UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
   if (!fd) return failure(errno);

@@ -125,7 +125,7 @@ Result<void, Kind> giveToGroup(const std::filesystem::path& path, const std::str
 }
 
 // bind() gives the file the permissions of the descriptor, minus the umask. At first, only the
-// owner may have any: if the file were open to others now, a connect() of theirs could succeed as
+// owner may connect: if the file were open to other users now, their connect() could succeed as
 // soon as the socket listens.
 bool closeToOthers(int fd, const SocketAccess& access) {
   constexpr std::uint32_t kOwner = 0700;

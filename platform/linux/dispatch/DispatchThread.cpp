@@ -9,8 +9,8 @@ namespace halvox::platform::linux_ {
 namespace {
 
 // How many jobs one endHelping() runs before it leaves the others to the queues' own threads.
-// Helped jobs can add jobs; without a bound the I/O thread might never read a socket again. It is
-// far above what one turn of the loop delivers to a few clients, 64 requests each.
+// Helped jobs can add jobs; without a bound the I/O thread might never read a socket again. The
+// bound is far above what one turn of the loop delivers for a few clients, 64 requests each.
 constexpr std::size_t kHelpedJobsLimit = 1000;
 
 }  // namespace

@@ -26,7 +26,7 @@ using testing::simpleChannel;
 using ::testing::SizeIs;
 using Clock = std::chrono::steady_clock;
 
-// A source whose readings a test can delay.
+// A test closes it to delay the readings of a source.
 class Gate {
  public:
   void close() { set(false); }

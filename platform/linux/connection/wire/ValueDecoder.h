@@ -26,7 +26,8 @@ struct DecodeError {
   std::string key;
   // The signature of the value; empty if it is not known. Cut if it is malformed and long.
   std::string signature;
-  // One line of valid UTF-8 with both, for the log and for the answer to the client.
+  // One line of valid UTF-8 with the place and the signature, for the log and for the answer to the
+  // client.
   std::string message;
 };
 
