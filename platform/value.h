@@ -168,8 +168,8 @@ enum class ValueKind : std::uint8_t { kNone, kNumber, kString, kDate, kData, kAr
 // One property-list value: a number, a string, a date, data, an array or a dictionary.
 //
 // Values are immutable and shared: a copy costs at most one increment of a reference count, and
-// numbers and short strings live in the value itself. Sharing must be cheap and needs no lock,
-// because up to six consumers and a history hold the same message. Different threads may use
+// numbers and short strings live in the value itself. Up to six consumers and a history hold the
+// same message. Sharing must therefore be cheap. It needs no lock. Different threads may use
 // different copies at once; one value object belongs to one thread at a time.
 //
 // Two values are equal if their contents are equal. Numbers compare by value, whatever type they

@@ -11,7 +11,7 @@ enum class StoreError : std::uint8_t {
   kInUse,         // another service writes to this store
   kNewerVersion,  // a newer version made the store; it was left unchanged
   kMissing,       // there is no store (readers only)
-  kDamaged,       // the file is not a database, or a broken one
+  kDamaged,       // the file is not a database, or is a broken one
   kCannotOpen,    // any other error of the system or of SQLite
 };
 
