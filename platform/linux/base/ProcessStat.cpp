@@ -33,7 +33,8 @@ std::optional<ProcessStat> parseProcessStat(std::string_view text) {
     if (blank == std::string_view::npos) return std::nullopt;
     rest.remove_prefix(blank + 1);
   }
-  // Without the blank after it, the number could be the beginning of a longer one.
+  // Require the blank after the number. Otherwise the number could be the beginning of a longer
+  // one.
   const char* const end = rest.data() + rest.size();
   const auto [next, error] = std::from_chars(rest.data(), end, stat.startTicks);
   if (error != std::errc{} || next == end || *next != ' ') return std::nullopt;

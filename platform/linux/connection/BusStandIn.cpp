@@ -1,5 +1,6 @@
-// Answers the requests that clients of a bus send to their bus, for clients that are connected
-// without one. The service is known under its well-known name and as ":1.0", the client as ":1.N".
+// Answers the requests that clients send to their bus. Clients on our own socket have no bus, and
+// the service answers them itself. The service is known under its well-known name and as ":1.0",
+// the client as ":1.N".
 
 #include <array>
 #include <cstdint>

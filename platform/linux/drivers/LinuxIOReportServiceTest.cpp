@@ -26,7 +26,7 @@ using testing::simpleChannel;
 using ::testing::SizeIs;
 using Clock = std::chrono::steady_clock;
 
-// A test closes it to delay the readings of a source.
+// A gate that a test closes to delay the readings of a source.
 class Gate {
  public:
   void close() { set(false); }

@@ -36,7 +36,7 @@ struct MetricLabel {
   std::string name;
   std::string value;
   friend bool operator==(const MetricLabel&, const MetricLabel&) = default;
-  // NOLINTNEXTLINE(modernize-use-nullptr): what the compiler makes of the operator
+  // NOLINTNEXTLINE(modernize-use-nullptr): the compiler generates the operator
   friend auto operator<=>(const MetricLabel&, const MetricLabel&) = default;
 };
 using MetricLabels = std::vector<MetricLabel>;  // sorted by name
