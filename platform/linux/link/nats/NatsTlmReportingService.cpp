@@ -138,7 +138,7 @@ TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
   body += R"(,"payload":)";
   body += payload;
   body += '}';
-  // The identifier is the same at each attempt: the stream recognises by it a message that it
+  // The identifier is the same at each attempt, so that the stream recognises a message that it
   // already has. The random part keeps a restarted service from using numbers again.
   std::string id = instance_ + "-";
   append(id, lastMessage_.fetch_add(1, std::memory_order_relaxed) + 1);
