@@ -45,7 +45,7 @@ std::optional<std::filesystem::path> expandedPath(std::string_view text) {
 
 std::filesystem::path defaultSocketPath() {
   constexpr const char* kName = "reporting.sock";
-  // systemd sets it, and has already made the directory for the service's user.
+  // systemd sets this variable, and has already made the directory for the service's user.
   if (auto directory = environmentPath("RUNTIME_DIRECTORY")) return *directory / kName;
   if (auto directory = environmentPath("XDG_RUNTIME_DIR")) return *directory / "halvox" / kName;
   return std::filesystem::path("/run/halvox") / kName;

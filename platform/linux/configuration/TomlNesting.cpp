@@ -30,8 +30,8 @@ class NestingScan {
     rest_.remove_prefix(1);
     const bool beginsLine = isLineStart_;
     isLineStart_ = character == '\n' || (beginsLine && (character == ' ' || character == '\t'));
-    // A dot in a number counts too. It counts only until the number ends: the result is at most one
-    // level too high.
+    // A dot in a number counts too. The dot counts only until the number ends: the result is at
+    // most one level too high.
     if (character == '.') {
       deepen(1);
     } else if (character == '[' || character == '{') {

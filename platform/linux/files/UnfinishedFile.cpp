@@ -64,7 +64,7 @@ int UnfinishedFile::beginNamed() {
     ownName_.clear();
     return errno;
   }
-  // Until the file is locked, other processes do not remove it because it is new.
+  // Until the file is locked, its age protects it: other processes remove only older files.
   return ::flock(file_.get(), LOCK_EX | LOCK_NB) == 0 ? 0 : errno;
 }
 

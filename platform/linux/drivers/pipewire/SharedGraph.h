@@ -7,8 +7,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Shared by the thread of readings and the thread that follows the server. The source owns it; it
-// outlives the connection.
+// Shared by the thread of readings and the thread that follows the server. The source owns the
+// graph, which outlives the connection.
 struct SharedGraph {
   Mutex mutex{};
   Condition settled{};
