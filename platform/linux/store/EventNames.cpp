@@ -25,7 +25,7 @@ EventName* EventNames::find(std::string_view name) {
     EventName* present = slots_[index].load(std::memory_order_acquire);
     if (present == nullptr) {
       if (made == nullptr) {
-        // Threads that test the bound at the same time may exceed it by their number at most.
+        // Threads that test the bound at the same time may exceed it by at most their number.
         if (count_.load(std::memory_order_relaxed) >= kMostNames) return nullptr;
         made = std::make_unique<EventName>(name, matches(name));
       }

@@ -39,7 +39,7 @@ Value integer(plist_t node) {
   std::uint64_t number = 0;
   plist_get_uint_val(node, &number);
   if (number <= INT64_MAX) return static_cast<std::int64_t>(number);
-  // The library has no function for the sign, but prints it.
+  // The library has no function for the sign, but its text output contains it.
   OwnedText text;
   std::uint32_t length = 0;
   plist_to_xml(node, text.out(), &length);
