@@ -23,8 +23,8 @@ struct ProcessStat {
 // Any thread may call it.
 [[nodiscard]] std::optional<ProcessStat> readProcessStat(pid_t pid);
 
-// The same for this process. Also correct if /proc shows the processes of another PID namespace,
-// where this process has another number than getpid() returns.
+// Returns the same for this process. Also correct if /proc shows the processes of another PID
+// namespace, where this process has another number than getpid() returns.
 [[nodiscard]] std::optional<ProcessStat> readOwnProcessStat();
 
 }  // namespace halvox::platform::linux_

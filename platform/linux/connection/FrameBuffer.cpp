@@ -11,7 +11,7 @@ namespace {
 constexpr std::size_t kBodyLengthOffset = 4;
 
 // The longest header of a frame over the limit. The header must fit into the scratch, because the
-// refusal of the frame is an answer to it.
+// service answers the header with a refusal.
 constexpr std::size_t kMaxSkippableHeader = kReadBytes - 8;
 
 // The size of a header: its fixed part, the array of fields and the padding to 8 bytes.

@@ -43,9 +43,9 @@ class SourceReader {
   SourceReader& operator=(const SourceReader&) = delete;
   ~SourceReader();
 
-  // The first one begins to open the source. The second one waits until it has opened. If that
-  // takes too long, it logs this, and the source counts as late. Call each once, in this order,
-  // before everything else.
+  // startOpening() begins to open the source. waitUntilOpen() waits until the source has opened. If
+  // that takes too long, it logs an error, and the source counts as late. Call each once, in this
+  // order, before everything else.
   void startOpening();
   void waitUntilOpen();
   // A request for a reading. The requesting thread passes it to take(), once.
