@@ -191,8 +191,8 @@ class ClientWorker {
   bool readable_ = false;             // the socket may have bytes to read, or have been closed
   bool windowIsOpen_ = true;
   std::uint32_t lastSerial_ = 0;
-  // The sent calls, with consecutive serials up to `lastSerial_`. Does not have the oldest ones
-  // once they are answered.
+  // The sent calls, with consecutive serials up to `lastSerial_`. The oldest ones are removed when
+  // they are answered.
   std::deque<OpenCall> open_;
   std::size_t unanswered_ = 0;
   std::size_t openBytes_ = 0;

@@ -79,8 +79,8 @@ void addCommandLine(Facts& facts, const fs::path& process) {
   if (!finding.isCollected()) return facts.addFailure("cmdline", finding.failure);
   std::vector<Value> words;
   for (std::size_t begin = 0; begin < finding.bytes.size();) {
-    // The kernel ends each word with a NUL. A process that has overwritten its words may lack the
-    // last one.
+    // The kernel ends each word with a NUL. If a process has overwritten its words, the last NUL
+    // may be missing.
     const std::size_t end = std::min(finding.bytes.find('\0', begin), finding.bytes.size());
     words.emplace_back(replaceInvalidUtf8(finding.bytes.substr(begin, end - begin)));
     begin = end + 1;

@@ -93,8 +93,8 @@ std::vector<std::string> TextfileSource::list(int directory) {
     const std::string_view name = found->d_name;
     if (name.ends_with(".prom") && !name.starts_with('.')) files.emplace_back(name);
   }
-  // Sort the files, because the first one that defines a channel has it. The order must not change
-  // between two readings.
+  // Sort the files, because the first one that defines a channel provides it. The order must not
+  // change between two readings.
   std::ranges::sort(files);
   const bool areTooMany = files.size() > kMostFiles;
   if (areTooMany && !std::exchange(isExcessLogged_, true)) {
