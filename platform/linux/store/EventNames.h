@@ -10,7 +10,7 @@
 namespace halvox::platform::linux_ {
 
 // One event name. Any thread may read the constant members. The others are the name's row in the
-// database and belong to the store's writer; they are valid while `generation` is the one of
+// database and belong to the store's writer; they are valid while `generation` equals that of
 // AnalyticsRecords.
 struct EventName {
   EventName(std::string_view name, bool wanted) : text(name), isWanted(wanted) {}

@@ -42,11 +42,11 @@ struct OutgoingMessage {
 //            lets all later unacknowledged messages follow in order, and then the queue.
 //
 // Why one probe first: while a cluster elects a leader, it drops some messages and stores others.
-// Without the probe, a later message would overtake an earlier one. The stream recognises a message
-// that it already has by its identifier, and acknowledges it without storing it twice. This keeps
-// the order of a session's messages even when the leader of the stream is lost. One exception: if
-// the leader changes faster than a message travels to the server and back, a later message can be
-// stored before an earlier one.
+// Without the probe, a later message would overtake an earlier one. The stream uses the identifier
+// to recognise a message that it already has, and acknowledges the message without storing it
+// twice. This keeps the order of a session's messages even when the leader of the stream is lost.
+// One exception: if the leader changes faster than a message travels to the server and back, a
+// later message can be stored before an earlier one.
 //
 // A probe without a response can mean that the stream was deleted or that its server lost its
 // files. The publisher then creates the stream again. A message without an acknowledgement within

@@ -122,7 +122,7 @@ Result<void, StoreError> StoreReader::forEachRecord(const RecordTable& table,
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   lastRead_ = 0;
-  // A store that an older service wrote lacks the table, and has no such records.
+  // A store from an older service lacks the table and has no such records.
   if (*version < table.sinceVersion) return {};
   RecordScan scan(database_, table, filter);
   SqliteCode code = scan.begin();
