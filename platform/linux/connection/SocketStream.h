@@ -39,8 +39,8 @@ class SocketStream final : public EventSource {
   // Continues with the serial after the last one that was used on the socket.
   void skipSerials(std::uint32_t last) { lastSerial_ = last; }
 
-  // One read into input(). The caller must settle the input before another stream reads: all share
-  // one scratch.
+  // Reads once into input(). The caller must settle the input before another stream reads: all
+  // share one scratch.
   Read read();
   // Says whether the owner wants calls of onReadable().
   void setReading(bool reading);
