@@ -14,8 +14,8 @@ namespace halvox::platform::linux_ {
 // a megabyte must not become a line of a megabyte.
 inline constexpr std::size_t kLongestLogLine = 8192;
 
-// Appends the text of an entry: escaped, to stay one line, and cut at kLongestLogLine with the
-// number of the bytes that are missing.
+// Appends the text of an entry, escaped so that it stays on one line. Cuts it at kLongestLogLine
+// and appends the number of missing bytes.
 void appendLogLineText(std::string& line, const LogEntry& entry);
 
 // Formats entries as lines of text in local time, each with its end:

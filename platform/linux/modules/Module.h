@@ -12,7 +12,7 @@ namespace halvox::platform::linux_ {
 struct Module {
   const char* file;  // such as "halvox-link-nats.so"
   // The function that makes the part. Its name ends with the version of its signature and of the
-  // classes that it shares with the program: raise it whenever one of these changes.
+  // classes that it shares with the program: raise the version whenever one of these changes.
   const char* entryPoint;
 };
 

@@ -24,7 +24,7 @@ struct DaemonProcess {
   // Notes the process in the file. Returns false if the file cannot be written.
   [[nodiscard]] bool write(const std::filesystem::path& noteFile) const;
 
-  // A process that has ended but that its parent has not waited for does not count as alive.
+  // A process that has ended does not count as alive, even if its parent has not waited for it.
   [[nodiscard]] bool isAlive() const;
   // Ends the process with SIGTERM, and with SIGKILL if it has not ended in time. Blocks until it
   // has ended, but no longer than twice the time.
