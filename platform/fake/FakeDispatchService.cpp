@@ -27,7 +27,7 @@ class RunningMark {
   }
 };
 
-// Marks a thread whose job waits as one that runs no job: it may then run other jobs.
+// While a job waits, its thread counts as running no job and may run other jobs.
 class StandingMark {
  public:
   StandingMark() : wasRunning_(std::exchange(runningJob, false)), queue_(runningQueue) {

@@ -101,7 +101,7 @@ SELECT time, signature, path FROM snapshot_records;
 )sql";
 
 // Step n migrates from version n to version n + 1. Never change a step that was released: stores
-// that have taken it would differ from new ones.
+// that have already applied it would differ from new ones.
 constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords};
 
 }  // namespace
