@@ -97,10 +97,10 @@ class FrameRing {
   const std::unique_ptr<Slot[]> slots_;
   const std::unique_ptr<char, Unmap> memory_;
   const std::unique_ptr<std::atomic<CellNumber>[]> next_;  // the cell after each cell
-  // The following are on a cache line each: producers write the first three, the consumer the last.
-  // The low half of `free_` is the first free cell + 1, or 0. The high half counts changes, because
-  // a cell may be popped and pushed between another thread's load and exchange. Acquire and release
-  // order the consumer's reading of a cell before its reuse.
+  // The following are on a cache line each: producers write the first three, the consumer the
+  // others. The low half of `free_` is the first free cell + 1, or 0. The high half counts changes,
+  // because a cell may be popped and pushed between another thread's load and exchange. Acquire and
+  // release order the consumer's reading of a cell before its reuse.
   alignas(64) std::atomic<std::uint64_t> free_{0};
   // All cells from this one on have never been used.
   alignas(64) std::atomic<CellNumber> fresh_{0};

@@ -159,8 +159,8 @@ class HalvoxClient {
 // connection has ended, every request fails with kNoService. Destruction closes the connection, and
 // the service then ends its sessions.
 //
-// The service answers requests about sessions that it does not know without an error, with true or
-// with default values.
+// For a session that it does not know, the service answers with true or default values, not with an
+// error.
 class HalvoxConnection {
  public:
   // Connects to a socket; an empty path stands for the usual places as in Options. The failure

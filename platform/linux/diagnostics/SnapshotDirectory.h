@@ -25,9 +25,9 @@ class SnapshotDirectory {
   [[nodiscard]] std::filesystem::path temporaryPath() const;
   // Creates the directory unless it exists, but not its parents.
   [[nodiscard]] Result<void> prepare() const;
-  // Renames the file at temporaryPath() to its final name and returns the new path: "<UTC
-  // time>-<type>-<sub-type>.tar.zst", with a number after the time if there already are snapshots
-  // of the same time. Never replaces a file.
+  // Renames the file at temporaryPath() to its final name and returns the new path. The name is
+  // "<UTC time>-<type>-<sub-type>.tar.zst", with a number after the time if there already are
+  // snapshots of the same time. Never replaces a file.
   [[nodiscard]] Result<std::filesystem::path> publish(Date time, std::string_view type,
                                                       std::string_view subType) const;
   // Deletes all snapshots except the newest `count`. Never deletes `justWritten`, which looks old
