@@ -80,8 +80,8 @@ ClientWorker::ClientWorker(Options options)
 ClientWorker::~ClientWorker() {
   if (!isOwnProcess()) {
     // After fork(), the thread exists only in the parent, and only the parent may use the
-    // connection.
-    thread_.detach();
+    // connection. There is nothing to join or detach here, so its object is abandoned.
+    static_cast<void>(std::make_unique<std::jthread>(std::move(thread_)).release());
     return;
   }
   closing_.store(true, std::memory_order_relaxed);
