@@ -3,9 +3,8 @@
 #include <map>
 #include <utility>
 
-#include <poll.h>
-
 #include "client/HalvoxClient.h"
+#include "client/PollUntil.h"
 #include "client/RequestEncoder.h"
 #include "client/ServiceStream.h"
 #include "platform/linux/connection/wire/ValueDecoder.h"
@@ -96,13 +95,9 @@ class HalvoxConnection::Impl {
   int processUntil(Deadline deadline) {
     ServiceStream& stream = connected_.stream;
     if (!stream.isOpen() || !stream.send()) return -ECONNRESET;
-    const auto left = deadline - std::chrono::steady_clock::now();
-    if (left.count() <= 0) return -ETIMEDOUT;
-    const auto seconds = std::chrono::duration_cast<std::chrono::seconds>(left);
-    const timespec remaining{.tv_sec = seconds.count(), .tv_nsec = (left - seconds).count()};
-    const int events = stream.hasOutput() ? POLLIN | POLLOUT : POLLIN;
-    pollfd polled{stream.fd(), static_cast<short>(events), 0};
-    if (ppoll(&polled, 1, &remaining, nullptr) <= 0) return 0;
+    if (std::chrono::steady_clock::now() >= deadline) return -ETIMEDOUT;
+    pollfd polled = stream.polled(POLLIN);
+    if (!pollUntil({&polled, 1}, deadline)) return 0;
     const bool alive = (polled.revents & ~POLLOUT) == 0 || stream.receive();
     if (stream.isReady()) takeReplies();
     return alive && stream.isOpen() ? 0 : -ECONNRESET;

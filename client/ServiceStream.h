@@ -7,6 +7,8 @@
 #include <variant>
 #include <vector>
 
+#include <poll.h>
+
 #include "client/HalvoxClient.h"
 #include "client/ServicePlaces.h"
 #include "platform/linux/base/UniqueHandle.h"
@@ -33,7 +35,10 @@ class ServiceStream {
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(fd_) && !ended_; }
   // Returns true once the service has agreed to the handshake.
   [[nodiscard]] bool isReady() const { return ready_; }
-  [[nodiscard]] int fd() const { return fd_.get(); }
+  // What to wait for on the socket: `events`, and that it can be written to while there is output.
+  [[nodiscard]] pollfd polled(short events) const {
+    return {fd_.get(), static_cast<short>(hasOutput() ? events | POLLOUT : events), 0};
+  }
   // True while appended bytes wait for send(), or for the socket to become writable.
   [[nodiscard]] bool hasOutput() const { return sent_ < output_.size(); }
   [[nodiscard]] std::size_t outputBytes() const { return output_.size() - sent_; }
