@@ -3,17 +3,16 @@
 #include <algorithm>
 #include <array>
 #include <atomic>
-#include <fstream>
 #include <future>
 #include <memory>
 #include <optional>
-#include <string>
 #include <thread>
 #include <vector>
 
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include "platform/linux/base/ProcessStat.h"
 #include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/log/QueuedLogService.h"
 #include "platform/linux/runtime/CounterStatisticsService.h"
@@ -46,13 +45,9 @@ class HelpingTest : public ::testing::Test {
     pid_t thread = 0;
     queue.async(JobWeight::kMayBlock, [&thread] { thread = ::gettid(); });
     if (!drain(queue)) return false;
-    const std::string status = "/proc/self/task/" + std::to_string(thread) + "/stat";
-    return eventually([&status] {
-      std::string number;
-      std::string name;
-      char state = 0;
-      std::ifstream(status) >> number >> name >> state;
-      return state == 'S';
+    return eventually([thread] {
+      const auto stat = readProcessStat(thread);  // threads have such a file too
+      return stat.has_value() && stat->state == 'S';
     });
   }
   // A job that records the thread that runs it.
