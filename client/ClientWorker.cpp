@@ -85,7 +85,8 @@ ClientWorker::~ClientWorker() {
   wake();
 }
 
-bool ClientWorker::send(const MessageView& message) {
+template <typename Content>
+bool ClientWorker::push(const BasicMessageView<Content>& message) {
   // Relaxed is enough: a program that sends while it destroys its client has a data race anyway.
   const bool isClosing = closing_.load(std::memory_order_relaxed);
   switch (isClosing ? EncodeOutcome::kNoRoom : ring_.tryPush(message)) {
@@ -102,6 +103,10 @@ bool ClientWorker::send(const MessageView& message) {
   if (asleep_.load(std::memory_order_seq_cst) && asleep_.exchange(false)) wake();
   return true;
 }
+
+bool ClientWorker::send(const MessageView& message) { return push(message); }
+
+bool ClientWorker::send(const EncodedMessageView& message) { return push(message); }
 
 void ClientWorker::post(SessionOperation operation) {
   {

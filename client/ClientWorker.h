@@ -68,6 +68,7 @@ class ClientWorker {
 
   // Any thread may call these; see HalvoxClient.
   bool send(const MessageView& message);
+  bool send(const EncodedMessageView& message);
   void post(SessionOperation operation);
   bool flush(std::chrono::milliseconds timeout);
   void setConnectionHandler(std::function<void(bool)> handler);
@@ -95,6 +96,9 @@ class ClientWorker {
     std::uint32_t bytes = 0;
     FlushTicket flush = 0;
   };
+
+  template <typename Content>
+  bool push(const BasicMessageView<Content>& message);
 
   // The loop, and its sleep.
   void run();

@@ -220,9 +220,10 @@ void ClientWorker::sendFlush(FlushTicket ticket) {
 }
 
 void ClientWorker::sendMessageAtHead() {
-  const std::size_t bytes = ring_.frontBytes();
+  const std::size_t bytes = kMessageHeaderBytes + ring_.frontBytes();
   char* frame = stream_.append(bytes);
-  ring_.take(frame);
+  putMessageHeader(frame, ring_.frontBytes());
+  ring_.take(frame + kMessageHeaderBytes);
   numberCall(frame, {.kind = OpenCall::Kind::kMessage, .bytes = static_cast<std::uint32_t>(bytes)});
 }
 

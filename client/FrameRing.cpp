@@ -71,13 +71,18 @@ FrameRing::FrameRing(std::size_t maxFrames, std::size_t maxBytes)
       memory_(map(std::size_t{cells_} * kCellBytes)),
       next_(std::make_unique<std::atomic<CellNumber>[]>(cells_)) {}
 
-EncodeOutcome FrameRing::tryPush(const MessageView& message) {
+EncodeOutcome FrameRing::tryPush(const MessageView& message) { return push(message); }
+
+EncodeOutcome FrameRing::tryPush(const EncodedMessageView& message) { return push(message); }
+
+template <typename Content>
+EncodeOutcome FrameRing::push(const BasicMessageView<Content>& message) {
   // reservePosition() tests this again. The test here saves encoding the message while the ring is
   // full.
   if (isFullAt(tail_.load(std::memory_order_relaxed))) return EncodeOutcome::kNoRoom;
   ChainSource cells(*this);
   SegmentWriter writer(cells);
-  const EncodeOutcome outcome = encodeMessage(writer, message);
+  const EncodeOutcome outcome = encodeBody(writer, message);
   if (outcome != EncodeOutcome::kDone) return outcome;
   std::uint64_t position = 0;
   if (!reservePosition(position)) return EncodeOutcome::kNoRoom;

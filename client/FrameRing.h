@@ -10,8 +10,9 @@
 
 namespace halvox::client {
 
-// Passes messages from any number of threads to one, as frames that are ready for the wire, bounded
-// in number and in bytes.
+// Passes messages from any number of threads to one, bounded in number and in bytes. A frame in the
+// ring is a body that is ready for the wire; its header, the same bytes for every message, is added
+// when the frame is sent.
 //
 //                   pop                  publish                   take
 //   free cells ─────────────► a frame ──────────────► slots ─────────────► the consumer
@@ -41,6 +42,7 @@ class FrameRing {
   // Any thread may call it. Returns kNoRoom if a bound is reached. Changes nothing unless it
   // returns kDone.
   EncodeOutcome tryPush(const MessageView& message);
+  EncodeOutcome tryPush(const EncodedMessageView& message);
   // The number of frames accepted so far, which is the position of the next one.
   [[nodiscard]] std::uint64_t tail() const { return tail_.load(std::memory_order_seq_cst); }
 
@@ -80,6 +82,8 @@ class FrameRing {
     void operator()(char* memory) const;
   };
 
+  template <typename Content>
+  EncodeOutcome push(const BasicMessageView<Content>& message);
   static std::unique_ptr<char, Unmap> map(std::size_t bytes);
   [[nodiscard]] Slot& slot(std::uint64_t position) const { return slots_[position & mask_]; }
   [[nodiscard]] char* cell(CellNumber number) const {

@@ -18,7 +18,7 @@ namespace dbus = platform::linux_::dbus;
 constexpr std::size_t kPlentyOfBytes = std::size_t{1} << 26;
 
 EncodeOutcome push(FrameRing& ring, const Dictionary& message, ReporterID id = 7) {
-  return ring.tryPush({std::span(&id, 1), message, 4, 1});
+  return ring.tryPush(MessageView{std::span(&id, 1), message, 4, 1});
 }
 bool pushNumber(FrameRing& ring, std::int64_t number, ReporterID id = 7) {
   return push(ring, {{"number", number}}, id) == EncodeOutcome::kDone;
@@ -26,8 +26,9 @@ bool pushNumber(FrameRing& ring, std::int64_t number, ReporterID id = 7) {
 
 // The arguments of the oldest frame, as the service decodes them.
 std::vector<Value> takeArguments(FrameRing& ring) {
-  std::string frame(ring.frontBytes(), '\0');
-  ring.take(frame.data());
+  std::string frame(kMessageHeaderBytes + ring.frontBytes(), '\0');
+  putMessageHeader(frame.data(), ring.frontBytes());
+  ring.take(frame.data() + kMessageHeaderBytes);
   setSerial(frame.data(), 1);
   const auto read = dbus::readFrame(std::as_bytes(std::span(frame)));
   std::vector<Value> arguments;

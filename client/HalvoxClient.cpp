@@ -43,12 +43,26 @@ bool HalvoxClient::send(ReporterID id, const Dictionary& message, Category categ
 bool HalvoxClient::send(const std::optional<std::vector<ReporterID>>& ids,
                         const Dictionary& message, Category category, EventType type) {
   if (ids) return sendTo(*ids, message, category, type);
-  return impl_->worker.send({std::nullopt, message, category, type});
+  return impl_->worker.send(MessageView{std::nullopt, message, category, type});
 }
 
 bool HalvoxClient::sendTo(std::span<const ReporterID> ids, const Dictionary& message,
                           Category category, EventType type) {
-  return impl_->worker.send({ids, message, category, type});
+  return impl_->worker.send(MessageView{ids, message, category, type});
+}
+
+bool HalvoxClient::send(ReporterID id, const EncodedDictionary& message, Category category,
+                        EventType type) {
+  return sendTo(std::span(&id, 1), message, category, type);
+}
+
+bool HalvoxClient::sendTo(std::span<const ReporterID> ids, const EncodedDictionary& message,
+                          Category category, EventType type) {
+  return impl_->worker.send(EncodedMessageView{ids, message, category, type});
+}
+
+bool HalvoxClient::sendToAll(const EncodedDictionary& message, Category category, EventType type) {
+  return impl_->worker.send(EncodedMessageView{std::nullopt, message, category, type});
 }
 
 bool HalvoxClient::flush(std::chrono::milliseconds timeout) { return impl_->worker.flush(timeout); }

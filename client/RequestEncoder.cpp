@@ -115,16 +115,23 @@ void appendRecipients(SegmentWriter& writer,
   SegmentWriter::replaceLength(outer, writer.position() - start);
 }
 
-bool encodeMessage(SegmentWriter& writer, ValueWriter& values, const MessageView& message) {
-  bool hasForm = true;
-  writeFrame(writer, kSendMessage, [&] {
-    hasForm = values.append(message.message);
-    if (!hasForm) return;
-    writer.number(message.category);
-    writer.number(message.type);
-    appendRecipients(writer, message.recipients);
-  });
-  return hasForm;
+template <typename Content>
+void appendEnd(SegmentWriter& writer, const BasicMessageView<Content>& message) {
+  writer.number(message.category);
+  writer.number(message.type);
+  appendRecipients(writer, message.recipients);
+}
+
+bool appendBody(SegmentWriter& writer, ValueWriter& values, const MessageView& message) {
+  if (!values.append(message.message)) return false;
+  appendEnd(writer, message);
+  return true;
+}
+
+EncodeOutcome outcomeOf(const SegmentWriter& writer, bool hasForm) {
+  if (writer.isFull()) return EncodeOutcome::kNoRoom;
+  const bool fits = kMessageHeaderBytes + writer.position() <= dbus::kMaxMessageBytes;
+  return hasForm && fits ? EncodeOutcome::kDone : EncodeOutcome::kNoWireForm;
 }
 
 Failure badRequest(std::string message) {
@@ -167,12 +174,30 @@ Request makeSetServiceType(ReporterID id, ServiceType type) {
 
 }  // namespace
 
-EncodeOutcome encodeMessage(SegmentWriter& writer, const MessageView& message) {
+const std::size_t kMessageHeaderBytes = kSendMessage.size;
+
+void putMessageHeader(char* frame, std::size_t bodyBytes) {
+  std::memcpy(frame, kSendMessage.bytes.data(), kSendMessage.size);
+  SegmentWriter::replaceLength(frame + dbus::kBodyLengthOffset, bodyBytes);
+}
+
+EncodeOutcome encodeBody(SegmentWriter& writer, const MessageView& message) {
   ValueWriter values(writer);
-  const bool hasForm = encodeMessage(writer, values, message);
-  if (writer.isFull()) return EncodeOutcome::kNoRoom;
-  if (!hasForm || writer.position() > dbus::kMaxMessageBytes) return EncodeOutcome::kNoWireForm;
-  return EncodeOutcome::kDone;
+  const bool hasForm = appendBody(writer, values, message);
+  return outcomeOf(writer, hasForm);
+}
+
+EncodeOutcome encodeBody(SegmentWriter& writer, const EncodedMessageView& message) {
+  const WireDictionary content = message.message.wireForm();
+  const std::size_t bytes = content.entries.size();
+  if (1 + content.levels > dbus::kMaxNesting || bytes > dbus::kMaxArrayBytes) {
+    return EncodeOutcome::kNoWireForm;
+  }
+  writer.number(static_cast<std::uint32_t>(bytes));
+  writer.align(8);
+  writer.bytes(content.entries.data(), bytes);
+  appendEnd(writer, message);
+  return outcomeOf(writer, true);
 }
 
 Request makeRequest(const MessageView& message) {
@@ -180,7 +205,9 @@ Request makeRequest(const MessageView& message) {
   HeapSegments segments;
   SegmentWriter writer(segments);
   ValueWriter values(writer, &path);
-  if (!encodeMessage(writer, values, message)) return badRequest(values.error());
+  bool hasForm = true;
+  writeFrame(writer, kSendMessage, [&] { hasForm = appendBody(writer, values, message); });
+  if (!hasForm) return badRequest(values.error());
   return finish(writer, segments);
 }
 

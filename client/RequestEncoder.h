@@ -6,6 +6,7 @@
 #include <string>
 #include <variant>
 
+#include "client/EncodedDictionary.h"
 #include "client/HalvoxClient.h"
 #include "client/SegmentWriter.h"
 #include "client/SessionTable.h"
@@ -16,13 +17,16 @@
 namespace halvox::client {
 
 // Refers to the parts of a message, which the caller owns.
-struct MessageView {
+template <typename Content>
+struct BasicMessageView {
   // The sessions that it is for; std::nullopt stands for all active ones.
   std::optional<std::span<const ReporterID>> recipients;
-  const Dictionary& message;
+  const Content& message;
   Category category = 0;
   EventType type = 0;
 };
+using MessageView = BasicMessageView<Dictionary>;
+using EncodedMessageView = BasicMessageView<EncodedDictionary>;
 
 enum class EncodeOutcome : std::uint8_t {
   kDone,
@@ -30,9 +34,14 @@ enum class EncodeOutcome : std::uint8_t {
   kNoWireForm,  // not UTF-8, an absent value, nested too deep, or too long
 };
 
-// Writes the frame of sendMessage. Allocates nothing. Unless it returns kDone, the content of the
+// Writes the body of sendMessage. Allocates nothing. Unless it returns kDone, the content of the
 // segments is undefined.
-EncodeOutcome encodeMessage(SegmentWriter& writer, const MessageView& message);
+EncodeOutcome encodeBody(SegmentWriter& writer, const MessageView& message);
+EncodeOutcome encodeBody(SegmentWriter& writer, const EncodedMessageView& message);
+
+// The header of sendMessage: its size, a multiple of 8, and its bytes before a body of that size.
+extern const std::size_t kMessageHeaderBytes;
+void putMessageHeader(char* frame, std::size_t bodyBytes);
 
 // A frame, or why the wire cannot hold the request.
 using Request = std::variant<std::string, Failure>;

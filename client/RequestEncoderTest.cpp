@@ -151,9 +151,11 @@ TEST_P(RequestEncoderValueTest, SegmentsOfAnySizeGiveTheSameFrame) {
   SmallSegments segments(1000);
   SegmentWriter writer(segments);
 
-  ASSERT_EQ(encodeMessage(writer, view), EncodeOutcome::kDone);
+  ASSERT_EQ(encodeBody(writer, view), EncodeOutcome::kDone);
 
-  EXPECT_EQ(segments.text(writer.position()), std::get<std::string>(makeRequest(view)));
+  std::string header(kMessageHeaderBytes, '\0');
+  putMessageHeader(header.data(), writer.position());
+  EXPECT_EQ(header + segments.text(writer.position()), std::get<std::string>(makeRequest(view)));
 }
 
 INSTANTIATE_TEST_SUITE_P(AllKinds, RequestEncoderValueTest,
@@ -271,12 +273,13 @@ TEST_F(RequestEncoderTest, AFrameWithoutAnswerSaysSo) {
 TEST_F(RequestEncoderTest, WritesNoMoreThanTheSegmentsHold) {
   const Dictionary dictionary{{"text", std::string(100, 'x')}, {"n", 1}};
   const MessageView view{std::nullopt, dictionary, 4, 1};
-  const std::size_t needed = (std::get<std::string>(makeRequest(view)).size() + 7) / 8;
+  const std::size_t needed =
+      (std::get<std::string>(makeRequest(view)).size() - kMessageHeaderBytes + 7) / 8;
 
   for (std::size_t most = 0; most <= needed; ++most) {
     SmallSegments segments(most);
     SegmentWriter writer(segments);
-    EXPECT_EQ(encodeMessage(writer, view),
+    EXPECT_EQ(encodeBody(writer, view),
               most < needed ? EncodeOutcome::kNoRoom : EncodeOutcome::kDone);
   }
 }

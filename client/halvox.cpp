@@ -8,31 +8,27 @@
 #include <span>
 #include <string>
 #include <utility>
-#include <vector>
 
+#include "client/EncodedArray.h"
+#include "client/EncodedDictionary.h"
 #include "client/HalvoxClient.h"
 #include "client/Vocabulary.h"
-#include "platform/linux/base/Utf8.h"
 
 // The handles are plain structs around the C++ objects. No exception may leave this file. The
 // functions that are called here throw only if memory or threads are exhausted.
 
 namespace client = halvox::client;
-using halvox::platform::Data;
 using halvox::platform::Date;
-using halvox::platform::Dictionary;
-using halvox::platform::Value;
 
 struct halvox_client {
   explicit halvox_client(client::Options options) : client(std::move(options)) {}
   client::HalvoxClient client;
 };
 struct halvox_dictionary {
-  Dictionary dictionary;
+  client::EncodedDictionary dictionary;
 };
 struct halvox_array {
-  std::vector<Value> values;
-  [[nodiscard]] Value value() const { return halvox::platform::Array(values); }
+  client::EncodedArray array;
 };
 
 namespace {
@@ -54,28 +50,23 @@ halvox_result done(Work&& work) noexcept {
   });
 }
 
-// Returns std::nullopt for a text that a message cannot hold.
-std::optional<Value> textValue(const char* text) {
-  if (text == nullptr || !halvox::platform::linux_::isUtf8WithoutNul(text)) return std::nullopt;
-  return Value(text);
-}
-
-std::optional<Value> dataValue(const void* bytes, size_t size) {
+// The bytes of a data value; std::nullopt if there is no address.
+std::optional<std::span<const std::byte>> bytesAt(const void* bytes, size_t size) {
   if (bytes == nullptr && size > 0) return std::nullopt;
-  return Value(Data(std::span(static_cast<const std::byte*>(bytes), size)));
+  return std::span(static_cast<const std::byte*>(bytes), size);
 }
 
-halvox_result set(halvox_dictionary* dictionary, const char* key, std::optional<Value> value) {
-  const bool keyIsGood = key != nullptr && halvox::platform::linux_::isUtf8WithoutNul(key);
-  if (dictionary == nullptr || !keyIsGood || !value) return HALVOX_BAD_ARGUMENT;
-  dictionary->dictionary.set(key, std::move(*value));
-  return HALVOX_OK;
+template <typename Value>
+halvox_result set(halvox_dictionary* dictionary, const char* key, const Value& value) {
+  if (dictionary == nullptr || key == nullptr) return HALVOX_BAD_ARGUMENT;
+  return guarded(
+      [&] { return dictionary->dictionary.set(key, value) ? HALVOX_OK : HALVOX_BAD_ARGUMENT; });
 }
 
-halvox_result append(halvox_array* array, std::optional<Value> value) {
-  if (array == nullptr || !value) return HALVOX_BAD_ARGUMENT;
-  array->values.push_back(std::move(*value));
-  return HALVOX_OK;
+template <typename Value>
+halvox_result append(halvox_array* array, const Value& value) {
+  if (array == nullptr) return HALVOX_BAD_ARGUMENT;
+  return done([&] { array->array.append(value); });
 }
 
 size_t fill(std::string_view text, char* buffer, size_t size) {
@@ -174,59 +165,55 @@ size_t halvox_dictionary_count(const halvox_dictionary* dictionary) {
 
 halvox_result halvox_dictionary_set_int64(halvox_dictionary* dictionary, const char* key,
                                           int64_t value) {
-  return guarded([&] { return set(dictionary, key, value); });
+  return set(dictionary, key, value);
 }
 
 halvox_result halvox_dictionary_set_uint64(halvox_dictionary* dictionary, const char* key,
                                            uint64_t value) {
-  return guarded([&] { return set(dictionary, key, value); });
+  return set(dictionary, key, value);
 }
 
 halvox_result halvox_dictionary_set_double(halvox_dictionary* dictionary, const char* key,
                                            double value) {
-  return guarded([&] { return set(dictionary, key, value); });
+  return set(dictionary, key, value);
 }
 
 halvox_result halvox_dictionary_set_bool(halvox_dictionary* dictionary, const char* key,
                                          bool value) {
-  return guarded([&] { return set(dictionary, key, value); });
+  return set(dictionary, key, value);
 }
 
 halvox_result halvox_dictionary_set_string(halvox_dictionary* dictionary, const char* key,
                                            const char* value) {
-  return guarded([&] { return set(dictionary, key, textValue(value)); });
+  if (value == nullptr) return HALVOX_BAD_ARGUMENT;
+  return set(dictionary, key, value);
 }
 
 halvox_result halvox_dictionary_set_data(halvox_dictionary* dictionary, const char* key,
                                          const void* bytes, size_t size) {
-  return guarded([&] { return set(dictionary, key, dataValue(bytes, size)); });
+  const auto data = bytesAt(bytes, size);
+  return data ? set(dictionary, key, *data) : HALVOX_BAD_ARGUMENT;
 }
 
 halvox_result halvox_dictionary_set_date(halvox_dictionary* dictionary, const char* key,
                                          double seconds_since_1970) {
-  return guarded([&] { return set(dictionary, key, Date{seconds_since_1970}); });
+  return set(dictionary, key, Date{seconds_since_1970});
 }
 
 halvox_result halvox_dictionary_set_dictionary(halvox_dictionary* dictionary, const char* key,
                                                const halvox_dictionary* value) {
   if (value == nullptr) return HALVOX_BAD_ARGUMENT;
-  return guarded([&] { return set(dictionary, key, Value(value->dictionary)); });
+  return set(dictionary, key, value->dictionary);
 }
 
 halvox_result halvox_dictionary_set_array(halvox_dictionary* dictionary, const char* key,
                                           const halvox_array* value) {
   if (value == nullptr) return HALVOX_BAD_ARGUMENT;
-  return guarded([&] { return set(dictionary, key, value->value()); });
+  return set(dictionary, key, value->array);
 }
 
 bool halvox_dictionary_remove(halvox_dictionary* dictionary, const char* key) {
-  bool removed = false;
-  if (dictionary == nullptr || key == nullptr) return false;
-  guarded([&] {
-    removed = dictionary->dictionary.remove(key);
-    return HALVOX_OK;
-  });
-  return removed;
+  return dictionary != nullptr && key != nullptr && dictionary->dictionary.remove(key);
 }
 
 halvox_array* halvox_array_new(void) { return new (std::nothrow) halvox_array; }
@@ -234,45 +221,47 @@ halvox_array* halvox_array_new(void) { return new (std::nothrow) halvox_array; }
 void halvox_array_free(halvox_array* array) { delete array; }
 
 size_t halvox_array_count(const halvox_array* array) {
-  return array != nullptr ? array->values.size() : 0;
+  return array != nullptr ? array->array.size() : 0;
 }
 
 halvox_result halvox_array_append_int64(halvox_array* array, int64_t value) {
-  return guarded([&] { return append(array, value); });
+  return append(array, value);
 }
 
 halvox_result halvox_array_append_uint64(halvox_array* array, uint64_t value) {
-  return guarded([&] { return append(array, value); });
+  return append(array, value);
 }
 
 halvox_result halvox_array_append_double(halvox_array* array, double value) {
-  return guarded([&] { return append(array, value); });
+  return append(array, value);
 }
 
 halvox_result halvox_array_append_bool(halvox_array* array, bool value) {
-  return guarded([&] { return append(array, value); });
+  return append(array, value);
 }
 
 halvox_result halvox_array_append_string(halvox_array* array, const char* value) {
-  return guarded([&] { return append(array, textValue(value)); });
+  if (array == nullptr || value == nullptr) return HALVOX_BAD_ARGUMENT;
+  return guarded([&] { return array->array.append(value) ? HALVOX_OK : HALVOX_BAD_ARGUMENT; });
 }
 
 halvox_result halvox_array_append_data(halvox_array* array, const void* bytes, size_t size) {
-  return guarded([&] { return append(array, dataValue(bytes, size)); });
+  const auto data = bytesAt(bytes, size);
+  return data ? append(array, *data) : HALVOX_BAD_ARGUMENT;
 }
 
 halvox_result halvox_array_append_date(halvox_array* array, double seconds_since_1970) {
-  return guarded([&] { return append(array, Date{seconds_since_1970}); });
+  return append(array, Date{seconds_since_1970});
 }
 
 halvox_result halvox_array_append_dictionary(halvox_array* array, const halvox_dictionary* value) {
   if (value == nullptr) return HALVOX_BAD_ARGUMENT;
-  return guarded([&] { return append(array, Value(value->dictionary)); });
+  return append(array, value->dictionary);
 }
 
 halvox_result halvox_array_append_array(halvox_array* array, const halvox_array* value) {
   if (value == nullptr) return HALVOX_BAD_ARGUMENT;
-  return guarded([&] { return append(array, value->value()); });
+  return append(array, value->array);
 }
 
 // ---- The client
@@ -303,7 +292,12 @@ halvox_result halvox_client_set_service_type(halvox_client* client, int64_t id,
 halvox_result halvox_client_set_configuration(halvox_client* client, int64_t id,
                                               const halvox_dictionary* configuration) {
   if (client == nullptr || configuration == nullptr) return HALVOX_BAD_ARGUMENT;
-  return done([&] { client->client.setConfiguration(id, configuration->dictionary); });
+  return guarded([&] {
+    auto dictionary = configuration->dictionary.decode();
+    if (!dictionary) return HALVOX_BAD_ARGUMENT;
+    client->client.setConfiguration(id, std::move(*dictionary));
+    return HALVOX_OK;
+  });
 }
 
 halvox_result halvox_client_start(halvox_client* client, int64_t id) {
@@ -343,7 +337,7 @@ halvox_result halvox_client_send_to_all(halvox_client* client, const halvox_dict
                                         uint32_t category, uint16_t type) {
   if (client == nullptr || message == nullptr) return HALVOX_BAD_ARGUMENT;
   return guarded(
-      [&] { return sent(client->client.send(std::nullopt, message->dictionary, category, type)); });
+      [&] { return sent(client->client.sendToAll(message->dictionary, category, type)); });
 }
 
 halvox_result halvox_client_flush(halvox_client* client, uint32_t timeout_ms) {

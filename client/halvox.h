@@ -26,8 +26,13 @@
  * reading. While one thread changes it, no other thread may use it.
  *
  * Ownership: release the result of a ..._new function with the ..._free function of the same kind;
- * these accept NULL and do nothing. Functions copy all other arguments before they return. Copying
- * a dictionary or an array only increments a reference count.
+ * these accept NULL and do nothing. Functions copy all other arguments before they return.
+ *
+ * Cost: dictionaries and arrays keep their content as the bytes that a message is made of. Sending
+ * a dictionary copies these bytes, and storing one container in another copies the inner one's.
+ * Make a message once, and change its values: a new number, or a text of the same length, for an
+ * existing key overwrites the old one and allocates nothing. Up to 16 keys and 512 bytes need no
+ * memory but that of halvox_dictionary_new().
  *
  * Errors: functions that can fail return a halvox_result, or NULL or false as their comment says.
  * Passing NULL where a client, dictionary or array is needed is HALVOX_BAD_ARGUMENT, never a crash.
@@ -192,8 +197,7 @@ HALVOX_API halvox_result halvox_dictionary_set_dictionary(halvox_dictionary* dic
                                                           const halvox_dictionary* value);
 HALVOX_API halvox_result halvox_dictionary_set_array(halvox_dictionary* dictionary, const char* key,
                                                      const halvox_array* value);
-/* Removes a key. Returns false if there was no such key, or if there was no memory for the change.
- */
+/* Removes a key. Returns false if there was no such key. */
 HALVOX_API bool halvox_dictionary_remove(halvox_dictionary* dictionary, const char* key);
 
 /* Makes an empty array. The caller owns it and releases it with halvox_array_free(). Returns NULL
@@ -284,7 +288,8 @@ HALVOX_API halvox_result halvox_client_create_session(halvox_client* client, int
 HALVOX_API halvox_result halvox_client_set_service_type(halvox_client* client, int64_t id,
                                                         uint16_t service_type);
 /* Merges a dictionary into the session's configuration: a new value replaces the old one of the
- * same key. */
+ * same key. Returns HALVOX_BAD_ARGUMENT if the dictionary is nested too deep for a message or
+ * longer than 64 MiB. */
 HALVOX_API halvox_result halvox_client_set_configuration(halvox_client* client, int64_t id,
                                                          const halvox_dictionary* configuration);
 /* Starts reporting for the session. The service answers a start only at the stop; the client does

@@ -1,0 +1,60 @@
+#pragma once
+
+#include <cstddef>
+#include <span>
+#include <string_view>
+
+#include "client/ByteBuffer.h"
+#include "client/WireValue.h"
+
+namespace halvox::client {
+
+class EncodedDictionary;
+
+// A list of values, kept as the bytes that they are on the wire. Several threads may read one at
+// the same time; while one thread changes it, no other may use it.
+//
+// Padding depends on where the array begins in its message: at a multiple of 8 or 4 bytes after
+// one. The array keeps its elements in both forms. A message that takes it then copies bytes, and
+// need not understand them.
+class EncodedArray {
+ public:
+  EncodedArray();
+  EncodedArray(const EncodedArray&) = delete;
+  EncodedArray& operator=(const EncodedArray&) = delete;
+
+  [[nodiscard]] std::size_t size() const { return size_; }
+
+  // Append one value, which is copied. Throw std::bad_alloc, and then change nothing. A text must
+  // be UTF-8 without NUL; for another one, append() returns false and changes nothing.
+  template <platform::ArithmeticNumber Number>
+  void append(Number number) {
+    appendVariant(wireNumber(number));
+  }
+  void append(platform::Date date) { appendVariant(date); }
+  void append(std::span<const std::byte> bytes) { appendVariant(WireData{bytes}); }
+  void append(const EncodedArray& array);
+  void append(const EncodedDictionary& dictionary);
+  [[nodiscard]] bool append(std::string_view text);
+  [[nodiscard]] bool append(const char* text) { return append(std::string_view(text)); }
+
+  // The elements; valid until this array is changed.
+  [[nodiscard]] WireArray wireForm() const {
+    return {atEight_.bytes(), atFour_.bytes().subspan(kFour), levels_};
+  }
+
+ private:
+  // The bytes before the elements in `atFour_`.
+  static constexpr std::size_t kFour = 4;
+
+  void reserve(std::size_t room);
+  template <typename WireForm>
+  void appendVariant(const WireForm& value);
+
+  std::size_t size_ = 0;
+  unsigned levels_ = 0;
+  ByteBuffer<128> atEight_;
+  ByteBuffer<128> atFour_;  // begins with kFour bytes that belong to no element
+};
+
+}  // namespace halvox::client

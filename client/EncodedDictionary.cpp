@@ -1,0 +1,278 @@
+#include "client/EncodedDictionary.h"
+
+#include <algorithm>
+#include <bit>
+#include <string>
+
+#include "client/EncodedArray.h"
+#include "platform/linux/connection/wire/ValueDecoder.h"
+
+namespace halvox::client {
+namespace {
+
+namespace dbus = platform::linux_::dbus;
+
+// What an entry needs in addition to its key and its variant: padding on both sides, the length of
+// the key and its NUL.
+constexpr std::size_t kKeyRoom = 24;
+
+constexpr std::size_t roundUp(std::size_t size) { return (size + 7) & ~std::size_t{7}; }
+
+// The program chooses its keys, therefore the hash needs no secret.
+std::uint32_t hashOf(std::string_view key) {
+  constexpr std::uint64_t kFactor = 0x9E3779B97F4A7C15;
+  const auto word = [&](std::size_t at, std::size_t size) {
+    std::uint64_t bytes = 0;
+    std::memcpy(&bytes, key.data() + at, size);
+    return bytes;
+  };
+  const auto mix = [](std::uint64_t hash, std::uint64_t bytes) {
+    hash = (hash ^ bytes) * kFactor;
+    return hash ^ (hash >> 32U);
+  };
+  const std::size_t size = key.size();
+  std::uint64_t hash = size;
+  if (size >= 8) {
+    for (std::size_t at = 0; at + 8 < size; at += 8) hash = mix(hash, word(at, 8));
+    hash = mix(hash, word(size - 8, 8));
+  } else if (size >= 4) {
+    hash = mix(hash, word(0, 4) | word(size - 4, 4) << 32U);
+  } else {
+    for (const char character : key) hash = mix(hash, static_cast<unsigned char>(character));
+  }
+  return static_cast<std::uint32_t>(hash);
+}
+
+char* aligned(char* at, std::size_t alignment) {
+  return at + ((0 - reinterpret_cast<std::uintptr_t>(at)) & (alignment - 1));
+}
+
+// Each overwrites the variant with a value that takes the same bytes. Returns false if the variant
+// is of another type or size.
+bool overwrite(char* variant, const WireNumber& number) {
+  if (variant[0] != 1 || variant[1] != number.type) return false;
+  char* const at = aligned(variant + 3, number.size);
+  if (number.size == 8) {
+    std::memcpy(at, number.bytes.data(), 8);
+  } else {
+    std::memcpy(at, number.bytes.data(), number.size);
+  }
+  return true;
+}
+
+bool overwrite(char* variant, const platform::Date& date) {
+  if (variant[0] != 3 || variant[1] != '(') return false;
+  put(aligned(variant + 5, 8), date.secondsSince1970);
+  return true;
+}
+
+bool overwrite(char* variant, const WireText& text) {
+  if (variant[0] != 1 || variant[1] != 's') return false;
+  char* const at = aligned(variant + 3, 4);
+  std::uint32_t length = 0;
+  std::memcpy(&length, at, sizeof length);
+  if (length != text.text.size()) return false;
+  copyText(at + sizeof length, text.text);
+  return true;
+}
+
+template <typename WireForm>
+bool overwrite(char* /*variant*/, const WireForm& /*value*/) {
+  return false;
+}
+
+}  // namespace
+
+void EncodedDictionary::Entries::reserveOne() {
+  if (size_ < capacity_) return;
+  std::vector<Entry> grown(2 * capacity_);
+  std::copy(begin_, begin_ + size_, grown.begin());
+  heap_ = std::move(grown);
+  begin_ = heap_.data();
+  capacity_ = heap_.size();
+}
+
+bool EncodedDictionary::hasKey(const Entry& entry, std::string_view key) const {
+  const char* const at = bytes_.data() + std::size_t{entry.start} * 8;
+  std::uint32_t length = 0;
+  std::memcpy(&length, at, sizeof length);
+  return std::string_view(at + sizeof length, length) == key;
+}
+
+// Returns size() if there is no such key.
+std::size_t EncodedDictionary::find(std::string_view key, std::uint32_t hash) const {
+  const std::size_t count = entries_.size();
+  if (table_.empty()) {
+    for (std::size_t index = 0; index < count; ++index) {
+      if (entries_[index].hash == hash && hasKey(entries_[index], key)) return index;
+    }
+    return count;
+  }
+  const std::size_t mask = table_.size() - 1;
+  for (std::size_t place = hash & mask; table_[place] != 0; place = (place + 1) & mask) {
+    const std::size_t index = table_[place] - 1;
+    if (entries_[index].hash == hash && hasKey(entries_[index], key)) return index;
+  }
+  return count;
+}
+
+char* EncodedDictionary::variantOf(std::size_t index, std::string_view key) {
+  return startOf(index) + sizeof(std::uint32_t) + key.size() + 1;
+}
+
+// Makes room for one more entry. Everything that can fail happens here.
+void EncodedDictionary::reserve(std::size_t room) {
+  const std::size_t most = entries_.size() + 1;
+  entries_.reserveOne();
+  bytes_.reserve(room);
+  if (most > kMostWithoutTable && table_.size() < 2 * most) {
+    table_ = std::vector<std::uint32_t>(std::bit_ceil(4 * most));
+    fillTable();
+  }
+}
+
+void EncodedDictionary::fillTable() {
+  std::fill(table_.begin(), table_.end(), 0);
+  for (std::size_t index = 0; index < entries_.size(); ++index) addToTable(index);
+}
+
+void EncodedDictionary::addToTable(std::size_t index) {
+  if (table_.empty()) return;
+  const std::size_t mask = table_.size() - 1;
+  std::size_t place = entries_[index].hash & mask;
+  while (table_[place] != 0) place = (place + 1) & mask;
+  table_[place] = static_cast<std::uint32_t>(index + 1);
+}
+
+template <typename WireForm>
+bool EncodedDictionary::setVariant(std::string_view key, const WireForm& value) {
+  const std::uint32_t hash = hashOf(key);
+  const std::size_t index = find(key, hash);
+  const bool exists = index < entries_.size();
+  if (exists && overwrite(variantOf(index, key), value)) return true;
+  if (!exists && !isWireText(key)) return false;
+  reserve(kKeyRoom + key.size() + variantRoom(value));
+  const std::size_t sizeBefore = bytes_.size();
+  append(key, hash, value);
+  if (exists) {
+    moveLastTo(index, sizeBefore);
+    countLevels();
+  } else {
+    addToTable(index);
+    levels_ = std::max(levels_, variantLevels(value));
+  }
+  return true;
+}
+
+template <typename WireForm>
+void EncodedDictionary::append(std::string_view key, std::uint32_t hash, const WireForm& value) {
+  char* const start = padded(bytes_.reserve(0), 8);
+  bytes_.setEnd(putVariant(putKey(start, key), value));
+  entries_.append({.start = static_cast<std::uint32_t>((start - bytes_.data()) / 8),
+                   .hash = hash,
+                   .levels = static_cast<std::uint8_t>(variantLevels(value)),
+                   .padding = static_cast<std::uint8_t>(roundUp(bytes_.size()) - bytes_.size())});
+}
+
+// Replaces an entry by the last one, before which there were `sizeBefore` bytes.
+void EncodedDictionary::moveLastTo(std::size_t index, std::size_t sizeBefore) {
+  const std::size_t last = entries_.size() - 1;
+  Entry made = entries_[last];
+  char* const from = startOf(last);
+  char* const to = startOf(index);
+  const auto madeBytes = static_cast<std::size_t>(bytes_.data() + bytes_.size() - from);
+  made.start = entries_[index].start;
+  entries_[index] = made;
+  entries_.removeLast();
+  if (index + 1 == last) {
+    std::memmove(to, from, madeBytes);
+    bytes_.setEnd(to + madeBytes);
+    return;
+  }
+  char* const next = startOf(index + 1);
+  const std::size_t padded = madeBytes + made.padding;
+  std::memset(from + madeBytes, 0, made.padding);
+  std::rotate(to, from, from + padded);
+  // Now the order is: the new entry, the old one, those after it.
+  const auto oldBytes = static_cast<std::size_t>(next - to);
+  const std::size_t rest = sizeBefore - static_cast<std::size_t>(next - bytes_.data());
+  std::memmove(to + padded, to + padded + oldBytes, rest);
+  bytes_.setEnd(to + padded + rest);
+  for (std::size_t after = index + 1; after < last; ++after) {
+    entries_[after].start += static_cast<std::uint32_t>(padded / 8) -
+                             static_cast<std::uint32_t>(oldBytes / 8);  // may wrap around
+  }
+}
+
+void EncodedDictionary::countLevels() {
+  levels_ = 0;
+  for (std::size_t index = 0; index < entries_.size(); ++index) {
+    levels_ = std::max<unsigned>(levels_, entries_[index].levels);
+  }
+}
+
+bool EncodedDictionary::remove(std::string_view key) {
+  const std::size_t index = find(key, hashOf(key));
+  const std::size_t count = entries_.size();
+  if (index == count) return false;
+  char* const at = startOf(index);
+  if (index + 1 == count) {
+    bytes_.setEnd(at - (index == 0 ? 0 : entries_[index - 1].padding));
+  } else {
+    const char* const next = startOf(index + 1);
+    const auto rest = static_cast<std::size_t>(bytes_.data() + bytes_.size() - next);
+    const auto shift = static_cast<std::uint32_t>((next - at) / 8);
+    std::memmove(at, next, rest);
+    bytes_.setEnd(at + rest);
+    for (std::size_t after = index + 1; after < count; ++after) {
+      entries_[after - 1] = entries_[after];
+      entries_[after - 1].start -= shift;
+    }
+  }
+  entries_.removeLast();
+  countLevels();
+  fillTable();
+  return true;
+}
+
+bool EncodedDictionary::setNumber(std::string_view key, const WireNumber& number) {
+  return setVariant(key, number);
+}
+
+bool EncodedDictionary::set(std::string_view key, platform::Date date) {
+  return setVariant(key, date);
+}
+
+bool EncodedDictionary::set(std::string_view key, std::string_view text) {
+  return isWireText(text) && setVariant(key, WireText{text});
+}
+
+bool EncodedDictionary::set(std::string_view key, std::span<const std::byte> bytes) {
+  return setVariant(key, WireData{bytes});
+}
+
+bool EncodedDictionary::set(std::string_view key, const EncodedDictionary& dictionary) {
+  // The room first: it may move the entries, and `dictionary` may be this one.
+  reserve(kKeyRoom + key.size() + variantRoom(dictionary.wireForm()));
+  return setVariant(key, dictionary.wireForm());
+}
+
+bool EncodedDictionary::set(std::string_view key, const EncodedArray& array) {
+  return setVariant(key, array.wireForm());
+}
+
+std::optional<platform::Dictionary> EncodedDictionary::decode() const {
+  std::string body(8 + bytes_.size(), '\0');
+  put(body.data(), static_cast<std::uint32_t>(bytes_.size()));
+  std::memcpy(body.data() + 8, bytes_.data(), bytes_.size());
+  if (bytes_.size() > dbus::kMaxArrayBytes) return std::nullopt;
+  dbus::Frame frame;
+  frame.header.signature = "a{sv}";
+  frame.header.bigEndian = std::endian::native == std::endian::big;
+  frame.body = std::as_bytes(std::span(body));
+  std::vector<platform::Value> arguments;
+  if (dbus::decodeBody(frame, frame.header.signature, arguments)) return std::nullopt;
+  return arguments.front().dictionary();
+}
+
+}  // namespace halvox::client
