@@ -1,9 +1,11 @@
 #include "bench/client/RawClient.h"
 
 #include <cerrno>
+#include <chrono>
 #include <cstring>
 #include <stdexcept>
 #include <string_view>
+#include <thread>
 
 #include <sys/socket.h>
 #include <sys/un.h>
@@ -53,7 +55,7 @@ class Encoder {
   std::size_t start_;
 };
 
-std::string makeHeader() {
+std::string makeHeader(std::string_view member, std::string_view signature) {
   std::string header{'l', 1, 0, 1, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0, 0};
   Encoder encoder(header, 0);
   const auto field = [&](char code, char type, std::string_view value) {
@@ -70,8 +72,8 @@ std::string makeHeader() {
   };
   field(1, 'o', "/com/tarno/halvox/reporting");
   field(2, 's', "com.tarno.halvox.HVReportingServiceProtocol");
-  field(3, 's', "sendMessage");
-  field(8, 'g', "a{sv}uqaax");
+  field(3, 's', member);
+  field(8, 'g', signature);
   encoder.patch(12, header.size() - 16);
   encoder.align(8);
   return header;
@@ -79,7 +81,8 @@ std::string makeHeader() {
 
 }  // namespace
 
-RawClient::RawClient(const std::string& socketPath) : input_(std::size_t{64} * 1024) {
+RawClient::RawClient(const std::string& socketPath, std::int64_t reporter)
+    : reporter_(reporter), input_(std::size_t{64} * 1024) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   socketPath.copy(address.sun_path, sizeof address.sun_path - 1);
@@ -104,7 +107,7 @@ RawClient::RawClient(const std::string& socketPath) : input_(std::size_t{64} * 1
 RawClient::~RawClient() { close(fd_); }
 
 void RawClient::encode(std::int64_t value) {
-  static const std::string header = makeHeader();
+  static const std::string header = makeHeader("sendMessage", "a{sv}uqaax");
   const std::size_t start = output_.size();
   output_ += header;
   Encoder encoder(output_, start);
@@ -125,21 +128,37 @@ void RawClient::encode(std::int64_t value) {
   encoder.key("volume", 'd');
   encoder.number(0.75);
   encoder.key("route", 's');
-  encoder.text("Speaker");
+  encoder.text(variesTexts_ ? mixedText(value, 12) : "Speaker");
   encoder.key("format", 's');
   encoder.text("lpcm/float32");
   encoder.key("device_uid", 's');
-  encoder.text("alsa_output.pci-0000_00_1f.3.analog-stereo");
+  encoder.text(variesTexts_ ? mixedText(value + 1, 42)
+                            : "alsa_output.pci-0000_00_1f.3.analog-stereo");
   encoder.key("latency_ms", 'd');
   encoder.number(10.67);
   encoder.patch(body, output_.size() - entries);
   encoder.number(std::uint32_t{4});
   encoder.number(std::uint16_t{18});
-  encoder.number(std::uint32_t{16});  // the bytes of one array of one identifier
-  encoder.number(std::uint32_t{8});
-  encoder.number(std::int64_t{1});
+  encoder.align(sizeof(std::uint32_t));
+  const std::size_t outer = output_.size();
+  encoder.number(std::uint32_t{0});
+  encoder.number(static_cast<std::uint32_t>(sizeof reporter_));
+  encoder.number(reporter_);
+  encoder.patch(outer, output_.size() - outer - sizeof(std::uint32_t));
   encoder.patch(start + 4, output_.size() - body);
   encoder.patch(start + 8, ++serial_);
+}
+
+std::string RawClient::mixedText(std::int64_t number, std::size_t length) {
+  std::string text;
+  auto state = static_cast<std::uint64_t>(number) * 0x9E3779B97F4A7C15U + 1;
+  while (text.size() < length) {
+    state ^= state << 13U;
+    state ^= state >> 7U;
+    state ^= state << 17U;
+    text += static_cast<char>('a' + static_cast<int>(state % 26));
+  }
+  return text;
 }
 
 void RawClient::sendAll() {
@@ -166,6 +185,7 @@ std::int64_t RawClient::receive() {
     const std::size_t total = ((16 + std::size_t{fields} + 7) & ~std::size_t{7}) + body;
     if (filled_ - used < total) break;
     if (input_[used + 1] == 2) ++answers;
+    if (input_[used + 1] == 3) throw std::runtime_error("the server refused a request");
     used += total;
   }
   std::memmove(input_.data(), input_.data() + used, filled_ - used);
@@ -182,6 +202,38 @@ void RawClient::pipeline(std::int64_t count, std::int64_t window) {
     while (answered < count && (sent - answered > window / 2 || sent == count)) {
       answered += receive();
     }
+  }
+}
+
+std::vector<double> RawClient::ping(int count) {
+  using Clock = std::chrono::steady_clock;
+  std::vector<double> times;
+  times.reserve(static_cast<std::size_t>(count));
+  auto next = Clock::now();
+  for (int number = 0; number < count; ++number) {
+    next += std::chrono::milliseconds(1);
+    std::this_thread::sleep_until(next);
+    const auto begin = Clock::now();
+    encode(number);
+    sendAll();
+    waitForAnswer();
+    times.push_back(std::chrono::duration<double>(Clock::now() - begin).count());
+  }
+  return times;
+}
+
+void RawClient::request(std::string_view member) {
+  const std::size_t start = output_.size();
+  output_ += makeHeader(member, "x");
+  Encoder encoder(output_, start);
+  encoder.number(reporter_);
+  encoder.patch(start + 4, sizeof reporter_);
+  encoder.patch(start + 8, ++serial_);
+  sendAll();
+}
+
+void RawClient::waitForAnswer() {
+  while (receive() == 0) {
   }
 }
 

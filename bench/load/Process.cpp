@@ -108,6 +108,10 @@ void Process::forgetPeak() const {
   std::ofstream("/proc/" + std::to_string(child_.pid()) + "/clear_refs") << "5";
 }
 
+long Process::writtenBytes() const {
+  return statusNumber("/proc/" + std::to_string(child_.pid()) + "/io", "write_bytes");
+}
+
 long Process::sleeps() const {
   long count = 0;
   const std::string tasks = "/proc/" + std::to_string(child_.pid()) + "/task";

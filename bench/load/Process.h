@@ -32,6 +32,9 @@ class Process {
   // The peak resident memory since the start or the last forgetPeak().
   [[nodiscard]] long peakKib() const;
   void forgetPeak() const;
+  // What the process has caused to be written to disks so far, in bytes. Data that is written twice
+  // before it reaches the disk counts once.
+  [[nodiscard]] long writtenBytes() const;
   // How often threads of the process went to sleep so far. Each time is one wake-up.
   [[nodiscard]] long sleeps() const;
 
