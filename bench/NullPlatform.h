@@ -1,6 +1,7 @@
 #pragma once
 
 #include <deque>
+#include <filesystem>
 #include <map>
 #include <memory>
 #include <string>
@@ -17,6 +18,7 @@
 #include "platform/fake/ServicesOf.h"
 #include "platform/feature_flags.h"
 #include "platform/kdebug.h"
+#include "platform/linux/files/FileOverflowService.h"
 #include "platform/log.h"
 #include "platform/process.h"
 #include "platform/services.h"
@@ -209,6 +211,9 @@ struct NullPlatform {
   NullLog log;
   NullProcess process;
   MapStatistics statistics;
+  // Not absent: a long history that is not kept would cost less than a real one.
+  platform::linux_::FileOverflowService overflow{
+      {.directory = std::filesystem::temp_directory_path()}, statistics};
 };
 
 // The instance of the program, which is never destroyed. Only errors are enabled in its log.

@@ -41,6 +41,7 @@ KtraceService& ktrace() { return installed().ktrace; }
 LogService& log() { return installed().log; }
 MetricService& metrics() { return installed().metrics; }
 NotifyService& notify() { return installed().notify; }
+OverflowService& overflow() { return installed().overflow; }
 PerformanceTraceService& performanceTraces() { return installed().performanceTraces; }
 PowerLogService& powerLog() { return installed().powerLog; }
 PreferenceService& preferences() { return installed().preferences; }

@@ -14,6 +14,7 @@
 #include "platform/fake/FakeLogService.h"
 #include "platform/fake/FakeMetricService.h"
 #include "platform/fake/FakeNotifyService.h"
+#include "platform/fake/FakeOverflowService.h"
 #include "platform/fake/FakePerformanceTraceService.h"
 #include "platform/fake/FakePowerLogService.h"
 #include "platform/fake/FakePreferenceService.h"
@@ -53,6 +54,7 @@ struct FakePlatform {
   FakeFileService files{journal};
   FakeMetricService metrics{journal};
   FakeNotifyService notify;
+  FakeOverflowService overflow;
   FakePowerLogService powerLog{journal};
   FakePreferenceService preferences;
   FakeIOReportService ioReport{journal};

@@ -23,6 +23,7 @@ template <typename Platform>
           .log = platform.log,
           .metrics = platform.metrics,
           .notify = platform.notify,
+          .overflow = platform.overflow,
           .performanceTraces = platform.performanceTraces,
           .powerLog = platform.powerLog,
           .preferences = platform.preferences,

@@ -13,6 +13,7 @@
 #include "platform/linux/dispatch/AsioDispatchService.h"
 #include "platform/linux/dispatch/Backpressure.h"
 #include "platform/linux/drivers/LinuxIOReportService.h"
+#include "platform/linux/files/FileOverflowService.h"
 #include "platform/linux/files/RootedFileService.h"
 #include "platform/linux/kdebug/LttngKdebugService.h"
 #include "platform/linux/link/local/CallbackThread.h"
@@ -67,6 +68,7 @@ struct LinuxAdapters {
   SqliteSnapshotRecorder snapshotRecorder{store};
   SnapshotDiagnosticReporterService diagnosticReporters;
   RootedFileService files;
+  FileOverflowService overflow;
   SqliteMetricService metrics{store, clock};
   PreferenceReader preferenceReader;
   InotifyNotifyService notify;

@@ -65,6 +65,7 @@ Services LinuxPlatform::services() {
           .log = *adapters_->log,
           .metrics = adapters_->metrics,
           .notify = adapters_->notify,
+          .overflow = adapters_->overflow,
           .performanceTraces = adapters_->traces->performanceTraces(),
           .powerLog = adapters_->powerLog,
           .preferences = adapters_->preferences,

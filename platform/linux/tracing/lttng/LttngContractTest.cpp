@@ -99,6 +99,7 @@ class LttngHarness {
                      .log = fakes_.log,
                      .metrics = fakes_.metrics,
                      .notify = fakes_.notify,
+                     .overflow = fakes_.overflow,
                      .performanceTraces = performanceTraces_,
                      .powerLog = fakes_.powerLog,
                      .preferences = fakes_.preferences,

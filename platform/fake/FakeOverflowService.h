@@ -1,0 +1,45 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <mutex>
+#include <optional>
+#include <vector>
+
+#include "platform/overflow.h"
+
+namespace halvox::platform {
+
+// Keeps bytes in memory. Any thread may call; the test sets errors and reads on its own.
+// FakePlatform owns it.
+class FakeOverflowService final : public OverflowService {
+ public:
+  // 64 MiB at first.
+  void setMemoryPerClient(std::size_t bytes);
+  // From now on writing, or reading, fails with that error; none ends it.
+  void setWriteError(std::optional<Error> error);
+  void setReadError(std::optional<Error> error);
+
+  // Sets a byte of each piece that is long enough, as a damaged disk would.
+  void damage(std::size_t position, std::byte value);
+
+  // The bytes that were written and not released.
+  [[nodiscard]] std::size_t keptBytes() const;
+
+  [[nodiscard]] std::size_t memoryPerClient() const override;
+  std::optional<Error> write(std::span<const std::byte> bytes, OverflowPlace& place) override;
+  std::optional<Error> read(OverflowPlace place, std::span<std::byte> bytes) override;
+  // Throws std::logic_error for a place that is not valid.
+  void release(OverflowPlace place) override;
+
+ private:
+  mutable std::mutex mutex_;
+  std::size_t memoryPerClient_ = std::size_t{64} * 1024 * 1024;
+  std::optional<Error> writeError_;
+  std::optional<Error> readError_;
+  std::uint64_t next_ = 0;
+  std::map<std::uint64_t, std::vector<std::byte>> pieces_;  // by offset
+};
+
+}  // namespace halvox::platform
