@@ -235,6 +235,12 @@ class Value {
   // The text of a string; empty for anything else. It is part of this value: valid until the value
   // is changed, moved from or destroyed.
   [[nodiscard]] std::string_view string() const;
+  // True if the values have the same type and the same bytes: the same number, short text or shared
+  // content. Costs a comparison of 16 bytes. Long texts and containers that are equal but not
+  // shared are not identical.
+  [[nodiscard]] bool isIdenticalTo(const Value& other) const noexcept {
+    return std::memcmp(storage_, other.storage_, sizeof storage_) == 0;
+  }
   // True if this string is that very constant (see StringConstant).
   [[nodiscard]] bool isIdenticalTo(const StringConstant& constant) const;
 
@@ -356,6 +362,8 @@ class Dictionary {
   void reserve(std::size_t entries);
   // Sets the value under a key. An existing key keeps its position; a new one goes to the end.
   void set(const Key& key, Value value);
+  // Sets the value of the entry at a position, which must be less than size().
+  void setAt(std::size_t position, Value value);
   // Removes the entry under a key; returns false if there was none.
   bool remove(const Key& key);
   // Sets every entry of `other`, in its order.

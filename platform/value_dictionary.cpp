@@ -159,6 +159,11 @@ void Dictionary::set(const Key& key, Value value) {
   noteAppended(*rep_);
 }
 
+void Dictionary::setAt(std::size_t position, Value value) {
+  makeRoomFor(rep_->count);
+  rep_->entries()[position].value = std::move(value);
+}
+
 bool Dictionary::remove(const Key& key) {
   const Entry* existing = findEntry(rep_, key);
   if (existing == nullptr) return false;

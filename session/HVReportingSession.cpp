@@ -166,6 +166,8 @@ void HVReportingSession::count(SessionHistory::Outcome outcome) const {
       return messages.redundant.add();
     case SessionHistory::Outcome::kNotStarted:
       return messages.notStarted.add();
+    case SessionHistory::Outcome::kNoRoom:
+      return messages.noRoom.add();
   }
 }
 

@@ -8,6 +8,7 @@
 
 #include "platform/fake/FakePlatform.h"
 #include "session/HVReportingSession.h"
+#include "session/HistoryFixture.h"
 
 namespace halvox {
 namespace {
@@ -36,12 +37,12 @@ class HVReportingSessionSendingTest : public testing::Test {
   std::vector<std::string> identifiers() const {
     std::vector<std::string> result;
     const auto history = session_->nestedAggregatedPayloadData();
-    for (const MessageHistory::Entry& entry : **history) result.push_back(entry.identifier());
+    for (const RecordedMessage& entry : messagesOf(**history)) result.push_back(entry.identifier);
     return result;
   }
   Dictionary recorded(std::size_t position) const {
     const auto history = session_->nestedAggregatedPayloadData();
-    return (**history)[position].message();
+    return messagesOf(**history)[position].message;
   }
 
   platform::FakePlatform platform_;

@@ -10,6 +10,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/fake/FakePlatform.h"
+#include "session/HistoryFixture.h"
 
 namespace halvox {
 namespace {
@@ -253,7 +254,7 @@ TEST_F(HVReportingSessionTest, RestartForgetsHistoryOfPreviousRun) {
 
   const auto history = session->nestedAggregatedPayloadData();
   ASSERT_EQ((*history)->size(), 1U);
-  EXPECT_EQ((**history)[0].identifier(), "Playback_Start_1");
+  EXPECT_EQ(messagesOf(**history)[0].identifier, "Playback_Start_1");
   EXPECT_EQ((*history)->count("Playback_Start"), 1U);
 }
 

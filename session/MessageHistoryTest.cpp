@@ -1,11 +1,15 @@
 #include "session/MessageHistory.h"
 
+#include <cstdint>
 #include <string>
+#include <utility>
+#include <vector>
 
 #include <gtest/gtest.h>
 
 #include "backends/HVReportingUtility.h"
 #include "platform/fake/FakePlatform.h"
+#include "session/HistoryFixture.h"
 
 namespace halvox {
 namespace {
@@ -37,8 +41,8 @@ TEST_F(MessageHistoryTest, NumbersTheMessagesOfOneBaseFromOneOn) {
   append(kPlayback, kStart, {{"a", 1}});
   append(kPlayback, kStart, {{"a", 2}});
 
-  EXPECT_EQ(history_[0].identifier(), "Playback_Start_1");
-  EXPECT_EQ(history_[1].identifier(), "Playback_Start_2");
+  EXPECT_EQ(messagesOf(history_)[0].identifier, "Playback_Start_1");
+  EXPECT_EQ(messagesOf(history_)[1].identifier, "Playback_Start_2");
   EXPECT_EQ(history_.count("Playback_Start"), 2U);
 }
 
@@ -47,16 +51,16 @@ TEST_F(MessageHistoryTest, NumbersEveryBaseByItself) {
   append(kPlayback, kState, {{"a", 2}});
   append(kPlayback | AudioEventCategory::kSession, kStart, {{"a", 3}});
 
-  EXPECT_EQ(history_[0].identifier(), "Playback_Start_1");
-  EXPECT_EQ(history_[1].identifier(), "Playback_State_1");
-  EXPECT_EQ(history_[2].identifier(), "Session_Playback_Start_1");
+  EXPECT_EQ(messagesOf(history_)[0].identifier, "Playback_Start_1");
+  EXPECT_EQ(messagesOf(history_)[1].identifier, "Playback_State_1");
+  EXPECT_EQ(messagesOf(history_)[2].identifier, "Session_Playback_Start_1");
 }
 
 TEST_F(MessageHistoryTest, CategoriesWithTheSameTextShareABase) {
   append(AudioEventCategory::kUndefined, kStart, {{"a", 1}});
   append(AudioEventCategory{16}, kStart, {{"a", 2}});
 
-  EXPECT_EQ(history_[1].identifier(), "Undefined_Start_2");
+  EXPECT_EQ(messagesOf(history_)[1].identifier, "Undefined_Start_2");
 }
 
 TEST_F(MessageHistoryTest, KeepsTheOrderOfAcceptance) {
@@ -65,7 +69,7 @@ TEST_F(MessageHistoryTest, KeepsTheOrderOfAcceptance) {
   append(kPlayback, kStart, {{"a", 3}});
 
   std::string order;
-  for (const MessageHistory::Entry& entry : history_) order += describe(entry.message());
+  for (const RecordedMessage& entry : messagesOf(history_)) order += describe(entry.message);
   EXPECT_EQ(order, "{a = 1}{a = 2}{a = 3}");
 }
 
@@ -90,8 +94,8 @@ TEST_F(MessageHistoryTest, StaysWholeWhenItIsMoved) {
   MessageHistory moved = std::move(history_);
   moved.append(moved.base(kPlayback, kStart), {{"a", 2}});
 
-  EXPECT_EQ(moved[0].identifier(), "Playback_Start_1");
-  EXPECT_EQ(moved[1].identifier(), "Playback_Start_2");
+  EXPECT_EQ(messagesOf(moved)[0].identifier, "Playback_Start_1");
+  EXPECT_EQ(messagesOf(moved)[1].identifier, "Playback_Start_2");
 }
 
 TEST_F(MessageHistoryTest, CodesBeyondTheBoundStillFindTheirBase) {
@@ -105,20 +109,80 @@ TEST_F(MessageHistoryTest, CodesBeyondTheBoundStillFindTheirBase) {
   EXPECT_EQ(history_.count("Session_Playback_Start"), 1U);
 }
 
-TEST_F(MessageHistoryTest, AMessageOfTenFieldsCostsAtMostFiveHundredBytes) {
-  Dictionary message;
-  for (int field = 0; field < 10; ++field)
-    message.set("field" + std::to_string(field), field * 0.5);
-  message.set("hvreporting_timestamp", 1.7e9);
-  message.set("systemuptime_sec", 1000);
-  message.set("processuptime_ms", 1000);
-  append(kPlayback, kStart, HVReportingUtilityAddAudioMessageTag(message, kPlayback, kStart));
+TEST_F(MessageHistoryTest, AMessageOfTenFieldsThatRepeatMostlyCostsAtMostTwentyBytes) {
+  constexpr int kMessages = 10'000;
+  const auto message = [](int number) {
+    Dictionary fields;
+    fields.set("frame_counter", std::int64_t{512} * number);
+    for (int field = 1; field < 9; ++field)
+      fields.set("field" + std::to_string(field), field * 0.5);
+    fields.set("device", "alsa_output.pci-0000_00_1f.3.analog-stereo");
+    fields.set("hvreporting_timestamp", 1.7e9 + 0.001 * number);
+    fields.set("systemuptime_sec", 1000 + number / 1000);
+    fields.set("processuptime_ms", std::uint64_t{1000} + static_cast<std::uint64_t>(number));
+    return HVReportingUtilityAddAudioMessageTag(fields, kPlayback, kStart);
+  };
+  append(kPlayback, kStart, message(0));
   const std::size_t before = history_.memorySize();
 
-  append(kPlayback, kStart, HVReportingUtilityAddAudioMessageTag(message, kPlayback, kStart));
+  for (int number = 1; number <= kMessages; ++number) append(kPlayback, kStart, message(number));
 
-  EXPECT_LE(history_.memorySize() - before, 500U);
-  EXPECT_GE(history_.memorySize() - before, 14 * sizeof(Dictionary::Entry));
+  EXPECT_LE(history_.memorySize() - before, 20U * kMessages);
+  EXPECT_EQ(messagesOf(history_).back().message, message(kMessages));
+}
+
+TEST_F(MessageHistoryTest, MessagesAreReadAsTheyWere) {
+  const std::string longText(3000, 'x');
+  const std::vector<Dictionary> messages{
+      {{"a", 1}, {"b", 2.5}, {"c", longText}},
+      {{"a", 2}, {"b", 2.5}, {"c", longText}},
+      {},
+      {{"c", "other"}, {"a", 1.0}, {"b", Value()}},  // the same keys in another order
+      {{"a", true}, {"b", platform::Array{1, "x"}}, {"c", platform::Date{1.5}}},
+      {{"a", 3}, {"d", Dictionary{{"e", 1}}}},
+      {{"a", 3}, {"b", platform::Array{1, "x"}}, {"c", platform::Date{2.5}}}};
+
+  for (const Dictionary& message : messages) append(kPlayback, kStart, message);
+
+  const auto read = messagesOf(history_);
+  ASSERT_EQ(read.size(), messages.size());
+  for (std::size_t position = 0; position < messages.size(); ++position) {
+    EXPECT_EQ(describe(read[position].message), describe(messages[position]));
+  }
+}
+
+// Each message has keys that no other has: most get no form of their own.
+TEST_F(MessageHistoryTest, MessagesOfManyShapesAreReadAsTheyWere) {
+  constexpr std::uint32_t kShapes = 1000;
+  const auto message = [](std::uint32_t shape) {
+    return Dictionary{{"key" + std::to_string(shape), shape},
+                      {"text", "of " + std::to_string(shape)}};
+  };
+  for (std::uint32_t shape = 0; shape < kShapes; ++shape) {
+    append(AudioEventCategory{shape % 16}, kStart, message(shape));
+  }
+  for (std::uint32_t shape = 0; shape < kShapes; ++shape) {
+    append(AudioEventCategory{shape % 16}, kStart, message(shape));
+  }
+
+  const auto read = messagesOf(history_);
+  ASSERT_EQ(read.size(), 2U * kShapes);
+  for (std::uint32_t number = 0; number < read.size(); ++number) {
+    EXPECT_EQ(read[number].message, message(number % kShapes));
+  }
+}
+
+TEST_F(MessageHistoryTest, AReaderGoesOnWithMessagesThatAreAddedMeanwhile) {
+  MessageHistory::Reader reader(history_);
+  EXPECT_EQ(reader.next(), nullptr);
+
+  for (int number = 1; number <= 5000; ++number) {
+    append(kPlayback, kStart, {{"a", number}});
+    const MessageHistory::Entry* entry = reader.next();
+    ASSERT_NE(entry, nullptr) << number;
+    EXPECT_EQ(entry->identifier(), "Playback_Start_" + std::to_string(number));
+    EXPECT_EQ(reader.next(), nullptr);
+  }
 }
 
 // A client can invent many categories, which all share one text.

@@ -83,6 +83,8 @@ class ResourceTally {
     if (account_ == nullptr) return;
     // Unsigned: if less is held now, the difference wraps and adding it subtracts.
     const std::size_t difference = after - before;
+    // The usual case: most messages fit into memory that a history already has.
+    if (difference == 0) return;
     account_->addBytes(difference);
     bytes_.fetch_add(difference, std::memory_order_relaxed);
   }

@@ -23,7 +23,8 @@ SessionCounters::Messages messagesOf(const Piece& piece) {
   return {.received = piece["received"],
           .recorded = piece["recorded"],
           .redundant = piece["suppressed: redundant"],
-          .notStarted = piece["not recorded: not started"]};
+          .notStarted = piece["not recorded: not started"],
+          .noRoom = piece["not recorded: no room"]};
 }
 
 SessionCounters::Link linkOf(const Piece& piece) {

@@ -18,12 +18,13 @@ struct SessionCounters {
     return std::make_shared<const SessionCounters>(statistics);
   }
 
-  // received = recorded + redundant + notStarted.
+  // received = recorded + redundant + notStarted + noRoom.
   struct Messages {
     platform::Counter& received;
     platform::Counter& recorded;
     platform::Counter& redundant;
     platform::Counter& notStarted;
+    platform::Counter& noRoom;
   };
   // received = sent + failed + single + redundant + notAllowed + testSession + noBackend + the
   // messages that wait in the queues.

@@ -1,9 +1,17 @@
 #include "session/SessionHistory.h"
 
+#include "platform/overflow.h"
+#include "platform/services.h"
 #include "session/SessionLog.h"
 
 namespace halvox {
 namespace {
+
+// Bytes of one history that are moved out at once, at least: moving fewer costs more than it saves.
+constexpr std::size_t kLeastToMove = 4 * 1024;
+// Bytes that one history may hold in memory: tens of thousands of ordinary messages, so that most
+// sessions never touch the disk.
+constexpr std::size_t kMostInMemory = 1024 * 1024;
 
 // Errors are never suppressed, however often they repeat. The category is compared as a whole, so
 // an error category with a domain is not exempt; this is required.
@@ -39,16 +47,39 @@ SessionHistory::Outcome SessionHistory::recordLocked(const Lock& history,
   // messages A, B, A all three are recorded, and two equal messages an hour apart are a repetition.
   // Both are required.
   const platform::Dictionary* previous = messages.newestMessage(base);
+  Outcome outcome = Outcome::kRecorded;
   if (previous != nullptr && !isExemptFromSuppression(category, type) &&
       equalApartFromVolatileKeys(*previous, message)) {
     kSessionLog.debug("dropping redundant event");
-    // Nothing was recorded, but the table of codes may have grown.
-    held_.change(before, messages.memorySize());
-    return Outcome::kRedundant;
+    outcome = Outcome::kRedundant;
+  } else if (makeRoom(messages)) {
+    messages.append(base, message);
+  } else {
+    messages.lose(base, message);
+    outcome = Outcome::kNoRoom;
   }
-  messages.append(base, message);
+  // Also if nothing was recorded: the table of codes may have grown.
   held_.change(before, messages.memorySize());
-  return Outcome::kRecorded;
+  return outcome;
+}
+
+// A history never refuses a message: when it takes much memory, it goes on in a file. Only the disk
+// limits it. A loss is logged once in a run, because a full disk stays full for many messages.
+bool SessionHistory::makeRoom(MessageHistory& messages) const {
+  const std::size_t movable = messages.movableSize();
+  if (movable < kLeastToMove) return true;
+  if (movable < kMostInMemory && !isClientOverItsShare()) return true;
+  const auto error = messages.moveOut();
+  if (error.has_value() && messages.lost() == 0) {
+    kSessionLog.error("the history of a session loses messages, and its summary will lack them, ",
+                      "until there is room for it: ", error->description);
+  }
+  return !error.has_value();
+}
+
+bool SessionHistory::isClientOverItsShare() const {
+  const std::shared_ptr<ResourceAccount>& account = held_.account();
+  return account != nullptr && account->use().bytes > platform::overflow().memoryPerClient();
 }
 
 }  // namespace halvox

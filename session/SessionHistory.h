@@ -15,6 +15,9 @@ namespace halvox {
 // The message history of a session's current run. It exists from begin() to end(); outside a run
 // messages are not recorded.
 //
+// A history that takes much memory goes on outside memory. If that fails, for instance because the
+// disk is full, it loses messages, which it logs, until there is room again.
+//
 // Owned by the session. Any thread may call; the history has one lock, which also guards the
 // counts of its identifiers.
 class SessionHistory {
@@ -22,8 +25,8 @@ class SessionHistory {
   // The history, locked. Holds none outside a run.
   using Lock = Guarded<std::optional<MessageHistory>>::Lock;
 
-  // What became of a message.
-  enum class Outcome : std::uint8_t { kRecorded, kRedundant, kNotStarted };
+  // What became of a message. kNoRoom: it would have been recorded.
+  enum class Outcome : std::uint8_t { kRecorded, kRedundant, kNotStarted, kNoRoom };
 
   // Charges the history to `held`, which must outlive this.
   explicit SessionHistory(ResourceTally& held) : held_(held) {}
@@ -49,6 +52,9 @@ class SessionHistory {
                        const platform::Dictionary& message);
 
  private:
+  [[nodiscard]] bool makeRoom(MessageHistory& messages) const;
+  [[nodiscard]] bool isClientOverItsShare() const;
+
   ResourceTally& held_;  // the session's
   Guarded<std::optional<MessageHistory>> history_;
 };

@@ -1,6 +1,7 @@
 #include "session/SessionSummary.h"
 
 #include <cstdint>
+#include <optional>
 #include <string_view>
 
 #include "backends/HVReportingUtility.h"
@@ -27,11 +28,14 @@ constexpr std::uint32_t kDirectoryPermissions = 0777;
 }  // namespace
 
 void SessionSummary::sendVolumeMessages(const Send& send) const {
-  VolumeWalk walk(HVReportingUtilityVolumeMinimumPlayingTime(profile_.serviceType()),
-                  history_.size());
+  std::optional<VolumeWalk> walk;
   const auto next = [&walk, this]() -> Message {
     const SessionHistory::Lock history = history_.lock();
-    return history->has_value() ? walk.next(**history) : std::nullopt;
+    if (!history->has_value()) return std::nullopt;
+    if (!walk.has_value()) {
+      walk.emplace(HVReportingUtilityVolumeMinimumPlayingTime(profile_.serviceType()), **history);
+    }
+    return walk->next();
   };
   // Logged once, before the first message, and only if there is one.
   Message message = next();
@@ -44,7 +48,9 @@ Message SessionSummary::createEvent() const {
   const SessionHistory::Lock history = history_.lock();
   if (!history->has_value() || (*history)->empty()) return std::nullopt;
   SummaryEvent event(profile_.serviceType());
-  for (const MessageHistory::Entry& entry : **history) event.add(entry.message());
+  MessageHistory::Reader reader(**history);
+  while (const MessageHistory::Entry* entry = reader.next()) event.add(entry->message());
+  logIfCutShort(reader);
   return event.take();
 }
 
@@ -64,9 +70,11 @@ void SessionSummary::writeFile() const {
     // Held until all of it has been written: the file shows one moment of the history.
     const SessionHistory::Lock history = history_.lock();
     if (!history->has_value()) return;
-    for (const MessageHistory::Entry& entry : **history) {
-      file->appendObject(entry.identifier(), entry.message());
+    MessageHistory::Reader reader(**history);
+    while (const MessageHistory::Entry* entry = reader.next()) {
+      file->appendObject(entry->identifier(), entry->message());
     }
+    logIfCutShort(reader);
   }
   std::string path;
   if (const auto error = file->commit(path)) {
@@ -74,6 +82,13 @@ void SessionSummary::writeFile() const {
   } else {
     kSessionLog.info("jsonOutput writeToURL: ", path);
   }
+}
+
+void SessionSummary::logIfCutShort(const MessageHistory::Reader& reader) const {
+  if (!reader.error().has_value()) return;
+  kSessionLog.error("the history of reporter ", number(profile_.reporterID()),
+                    " cannot be read to its end, the summary has only what precedes: ",
+                    reader.error()->description);
 }
 
 std::string SessionSummary::fileName() const {

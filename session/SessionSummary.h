@@ -4,6 +4,7 @@
 #include <string>
 
 #include "platform/value.h"
+#include "session/MessageHistory.h"
 #include "session/SessionHistory.h"
 
 namespace halvox {
@@ -33,6 +34,7 @@ class SessionSummary {
   void writeFile() const;
 
  private:
+  void logIfCutShort(const MessageHistory::Reader& reader) const;
   [[nodiscard]] std::string fileName() const;
 
   const SessionProfile& profile_;  // the session's

@@ -3,7 +3,6 @@
 #include <utility>
 
 #include "backends/HVReportingUtility.h"
-#include "session/MessageHistory.h"
 
 namespace halvox {
 namespace {
@@ -96,9 +95,12 @@ Dictionary VolumeIntervals::makeMessage(double seconds) const {
           {kPlaySecondsBucketedKey, bucketed(seconds, secondsBuckets(), kSecondsFractionDigits)}};
 }
 
-platform::Message VolumeWalk::next(const MessageHistory& history) {
-  while (position_ < end_ && position_ < history.size()) {
-    platform::Message message = intervals_.add(history[position_++].message());
+platform::Message VolumeWalk::next() {
+  while (left_ > 0) {
+    --left_;
+    const MessageHistory::Entry* entry = reader_.next();
+    if (entry == nullptr) break;
+    platform::Message message = intervals_.add(entry->message());
     if (message.has_value()) return message;
   }
   return std::nullopt;
@@ -107,8 +109,8 @@ platform::Message VolumeWalk::next(const MessageHistory& history) {
 std::vector<Dictionary> createVolumeMessages(const MessageHistory& history,
                                              double minimumPlaytime) {
   std::vector<Dictionary> messages;
-  VolumeWalk walk(minimumPlaytime, history.size());
-  while (platform::Message message = walk.next(history)) messages.push_back(std::move(*message));
+  VolumeWalk walk(minimumPlaytime, history);
+  while (platform::Message message = walk.next()) messages.push_back(std::move(*message));
   return messages;
 }
 

@@ -5,10 +5,9 @@
 #include <vector>
 
 #include "platform/value.h"
+#include "session/MessageHistory.h"
 
 namespace halvox {
-
-class MessageHistory;
 
 // Measures how long a client played at which volume, from its messages in order.
 //
@@ -54,20 +53,22 @@ class VolumeIntervals {
 // between them. Messages that are added during the walk are ignored: the session records each
 // volume message in the same history.
 //
-// Belongs to one thread. Does not hold the history, which the caller passes to each call.
+// Belongs to one thread, which holds the lock of the history during each call of next(). The
+// history must outlive it and stay where it is.
 class VolumeWalk {
  public:
-  // Walks the first `messages` messages; reports intervals longer than `minimumPlaytime` seconds.
-  VolumeWalk(double minimumPlaytime, std::size_t messages)
-      : intervals_(minimumPlaytime), end_(messages) {}
+  // Walks the messages that the history has now; reports intervals longer than `minimumPlaytime`
+  // seconds.
+  VolumeWalk(double minimumPlaytime, const MessageHistory& history)
+      : intervals_(minimumPlaytime), reader_(history), left_(history.size()) {}
 
-  // The next volume message, or none at the end. `history` is the same in every call.
-  platform::Message next(const MessageHistory& history);
+  // The next volume message, or none at the end.
+  platform::Message next();
 
  private:
   VolumeIntervals intervals_;
-  std::size_t position_ = 0;
-  const std::size_t end_;
+  MessageHistory::Reader reader_;
+  std::size_t left_;  // messages to walk
 };
 
 // All volume messages of a history, in the order in which their intervals ended. Intervals of at

@@ -215,6 +215,15 @@ class Service(Startable):
             rows = database.execute("SELECT name, payload FROM analytics_events").fetchall()
         return [(name, json.loads(payload)) for name, payload in rows]
 
+    def link_messages(self, session):
+        """The messages of a session on the link, as (category, type, payload)."""
+        if not self.database.exists():
+            return []
+        with contextlib.closing(sqlite3.connect(f"file:{self.database}?mode=ro", uri=True)) as database:
+            rows = database.execute("SELECT category, type, payload FROM link_messages"
+                                    " WHERE session_id = ? ORDER BY rowid", (session,)).fetchall()
+        return [(category, event_type, json.loads(payload)) for category, event_type, payload in rows]
+
     def wait_for_events(self, count):
         return wait_for(f"{count} events", lambda: len(found := self.events()) >= count and found)
 

@@ -143,16 +143,27 @@ class Hostile(unittest.TestCase):
         client.destroy(50)
         self.assertIs(client.create(51), True)
 
-    def test_history_bound_is_named_and_lifted_by_a_stop(self):
+    def test_no_history_is_so_long_that_a_message_is_refused(self):
         client = self.client()
         client.create(60)
         client.start_later(60)
+        for number in range(200):
+            client.send({"number": number, "bulk": "x" * 100_000}, reporters=[60])
+        client.stop(60)
+        summary = wait_for("the summary of the session", lambda: next(
+            (payload for _, _, payload in self.service.link_messages(60)
+             if "HV_Session_Summary_Event" in payload), None))
+        self.assertEqual(summary["number"], ",".join(str(number) for number in range(200)))
+
+    def test_memory_bound_is_named_and_lifted_by_destroying_what_holds_it(self):
+        client = self.client()
+        client.create(60)
         with self.assert_error("org.freedesktop.DBus.Error.LimitsExceeded",
                                "client_history_megabytes", "4"):
             for number in range(100):
-                client.send({"number": number, "bulk": "x" * 100_000}, reporters=[60])
-        client.stop(60)
-        self.assertIsNone(client.send({"number": 1}, reporters=[60]))
+                client.configure({f"key{number}": "x" * 100_000}, 60)
+        client.destroy(60)
+        self.assertIs(client.create(61), True)
 
     # --- bytes that are not D-Bus
     # ------------------------------------------------------------------

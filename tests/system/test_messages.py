@@ -2,7 +2,6 @@
 
 import contextlib
 import json
-import sqlite3
 import time
 import unittest
 from pathlib import Path
@@ -31,21 +30,10 @@ class MessagesTest(unittest.TestCase):
         client.start_later(7)
         return service, client
 
-    @staticmethod
-    def link_messages(service):
-        """The messages of session 7 on the link, as (category, type, payload)."""
-        if not service.database.exists():
-            return []
-        with contextlib.closing(
-                sqlite3.connect(f"file:{service.database}?mode=ro", uri=True)) as store:
-            rows = store.execute("SELECT category, type, payload FROM link_messages"
-                                 " WHERE session_id = 7 ORDER BY rowid").fetchall()
-        return [(category, event_type, json.loads(payload)) for category, event_type, payload in rows]
-
     def summary(self, service):
         """The summary event, which is the last message of a stop."""
         def last():
-            return next((payload for category, event_type, payload in self.link_messages(service)
+            return next((payload for category, event_type, payload in service.link_messages(7)
                          if (category, event_type) == (NO_CATEGORY, UNKNOWN)), None)
         return wait_for("the summary event", last)
 
@@ -53,7 +41,7 @@ class MessagesTest(unittest.TestCase):
         """Category, type and value of all messages before the summary event."""
         self.summary(service)
         return [(category, event_type, payload["value"])
-                for category, event_type, payload in self.link_messages(service)
+                for category, event_type, payload in service.link_messages(7)
                 if "value" in payload and event_type != UNKNOWN]
 
 
@@ -225,7 +213,7 @@ class SummaryEventTest(MessagesTest):
         client.stop(7)
         service.stop()
 
-        self.assertEqual(self.link_messages(service), [])
+        self.assertEqual(service.link_messages(7), [])
 
 
 if __name__ == "__main__":
