@@ -18,29 +18,47 @@ constexpr std::size_t kKeyRoom = 24;
 
 constexpr std::size_t roundUp(std::size_t size) { return (size + 7) & ~std::size_t{7}; }
 
-// The program chooses its keys, therefore the hash needs no secret.
-std::uint32_t hashOf(std::string_view key) {
-  constexpr std::uint64_t kFactor = 0x9E3779B97F4A7C15;
-  const auto word = [&](std::size_t at, std::size_t size) {
-    std::uint64_t bytes = 0;
-    std::memcpy(&bytes, key.data() + at, size);
-    return bytes;
-  };
-  const auto mix = [](std::uint64_t hash, std::uint64_t bytes) {
-    hash = (hash ^ bytes) * kFactor;
-    return hash ^ (hash >> 32U);
-  };
+// What one pass over a key finds out.
+struct KeyScan {
+  std::uint32_t hash = 0;
+  bool isPlain = false;  // ASCII without NUL; anything else needs the full test
+};
+
+// Reads texts of up to 32 bytes as two or four words that may overlap: without a loop, whose end
+// the processor could not predict. The program chooses its keys; the hash therefore needs no
+// secret.
+inline KeyScan scan(std::string_view key) {
+  constexpr std::uint64_t kFactors[] = {0x9E3779B97F4A7C15, 0xC2B2AE3D27D4EB4F, 0x165667B19E3779F9,
+                                        0xD6E8FEB86659FD93};
+  const char* const at = key.data();
   const std::size_t size = key.size();
   std::uint64_t hash = size;
+  std::uint64_t signs = 0;
+  const auto take = [&](std::uint64_t word, std::uint64_t factor) {
+    hash += word * factor;
+    signs |= highBits(word);
+  };
   if (size >= 8) {
-    for (std::size_t at = 0; at + 8 < size; at += 8) hash = mix(hash, word(at, 8));
-    hash = mix(hash, word(size - 8, 8));
+    take(load<std::uint64_t>(at), kFactors[0]);
+    take(load<std::uint64_t>(at + size - 8), kFactors[1]);
+    if (size > 16) {
+      take(load<std::uint64_t>(at + 8), kFactors[2]);
+      take(load<std::uint64_t>(at + size - 16), kFactors[3]);
+      for (std::size_t middle = 16; middle + 16 < size; middle += 8) {
+        hash = std::rotl(hash, 29) * kFactors[0];
+        take(load<std::uint64_t>(at + middle), kFactors[2]);
+      }
+    }
   } else if (size >= 4) {
-    hash = mix(hash, word(0, 4) | word(size - 4, 4) << 32U);
+    const std::uint64_t first = load<std::uint32_t>(at);
+    take(first | std::uint64_t{load<std::uint32_t>(at + size - 4)} << 32U, kFactors[0]);
   } else {
-    for (const char character : key) hash = mix(hash, static_cast<unsigned char>(character));
+    for (const char character : key) {
+      hash = hash * kFactors[0] + static_cast<unsigned char>(character);
+      signs |= static_cast<signed char>(character) > 0 ? 0 : kEachHighBit;
+    }
   }
-  return static_cast<std::uint32_t>(hash);
+  return {static_cast<std::uint32_t>(hash ^ (hash >> 32U)), (signs & kEachHighBit) == 0};
 }
 
 char* aligned(char* at, std::size_t alignment) {
@@ -100,7 +118,11 @@ bool EncodedDictionary::hasKey(const Entry& entry, std::string_view key) const {
 }
 
 // Returns size() if there is no such key.
-std::size_t EncodedDictionary::find(std::string_view key, std::uint32_t hash) const {
+inline std::size_t EncodedDictionary::find(std::string_view key, std::uint32_t hash) const {
+  return (seen_ & seenBit(hash)) == 0 ? size() : findSeen(key, hash);
+}
+
+std::size_t EncodedDictionary::findSeen(std::string_view key, std::uint32_t hash) const {
   const std::size_t count = entries_.size();
   if (table_.empty()) {
     for (std::size_t index = 0; index < count; ++index) {
@@ -121,10 +143,14 @@ char* EncodedDictionary::variantOf(std::size_t index, std::string_view key) {
 }
 
 // Makes room for one more entry. Everything that can fail happens here.
-void EncodedDictionary::reserve(std::size_t room) {
+inline void EncodedDictionary::reserve(std::size_t room) {
+  bytes_.reserve(room);
+  if (entries_.size() >= kInlineEntries) reserveEntry();
+}
+
+void EncodedDictionary::reserveEntry() {
   const std::size_t most = entries_.size() + 1;
   entries_.reserveOne();
-  bytes_.reserve(room);
   if (most > kMostWithoutTable && table_.size() < 2 * most) {
     table_ = std::vector<std::uint32_t>(std::bit_ceil(4 * most));
     fillTable();
@@ -146,11 +172,11 @@ void EncodedDictionary::addToTable(std::size_t index) {
 
 template <typename WireForm>
 bool EncodedDictionary::setVariant(std::string_view key, const WireForm& value) {
-  const std::uint32_t hash = hashOf(key);
+  const auto [hash, isPlain] = scan(key);
   const std::size_t index = find(key, hash);
   const bool exists = index < entries_.size();
   if (exists && overwrite(variantOf(index, key), value)) return true;
-  if (!exists && !isWireText(key)) return false;
+  if (!exists && !isPlain && !platform::linux_::isUtf8WithoutNul(key)) return false;
   reserve(kKeyRoom + key.size() + variantRoom(value));
   const std::size_t sizeBefore = bytes_.size();
   append(key, hash, value);
@@ -159,6 +185,7 @@ bool EncodedDictionary::setVariant(std::string_view key, const WireForm& value) 
     countLevels();
   } else {
     addToTable(index);
+    seen_ |= seenBit(hash);
     levels_ = std::max(levels_, variantLevels(value));
   }
   return true;
@@ -212,7 +239,7 @@ void EncodedDictionary::countLevels() {
 }
 
 bool EncodedDictionary::remove(std::string_view key) {
-  const std::size_t index = find(key, hashOf(key));
+  const std::size_t index = find(key, scan(key).hash);
   const std::size_t count = entries_.size();
   if (index == count) return false;
   char* const at = startOf(index);

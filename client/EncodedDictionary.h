@@ -93,20 +93,25 @@ class EncodedDictionary {
   template <typename WireForm>
   void append(std::string_view key, std::uint32_t hash, const WireForm& value);
   void reserve(std::size_t room);
+  void reserveEntry();
   void moveLastTo(std::size_t index, std::size_t sizeBefore);
   void countLevels();
   [[nodiscard]] std::size_t find(std::string_view key, std::uint32_t hash) const;
+  [[nodiscard]] std::size_t findSeen(std::string_view key, std::uint32_t hash) const;
   [[nodiscard]] bool hasKey(const Entry& entry, std::string_view key) const;
   [[nodiscard]] char* startOf(std::size_t index) {
     return bytes_.data() + std::size_t{entries_[index].start} * 8;
   }
   [[nodiscard]] char* variantOf(std::size_t index, std::string_view key);
+  static std::uint64_t seenBit(std::uint32_t hash) { return std::uint64_t{1} << (hash % 64); }
   void fillTable();
   void addToTable(std::size_t index);
 
   ByteBuffer<512> bytes_;
   Entries entries_;
   unsigned levels_ = 0;  // of the deepest value
+  // A bit for the hash of each key that has ever been set: most new keys need no comparison.
+  std::uint64_t seen_ = 0;
   // Of a large dictionary: the number of an entry plus 1, at a place that its hash chooses; 0 if
   // the place is free. Its size is a power of two.
   std::vector<std::uint32_t> table_;

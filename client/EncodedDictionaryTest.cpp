@@ -214,6 +214,41 @@ TEST(EncodedDictionaryTest, RefusesTextThatIsNotUtf8AndChangesNothing) {
   EXPECT_EQ(frameOf(message), frameOf(filled()));
 }
 
+// Puts a bad byte at every place of texts whose lengths are around the multiples of a word.
+TEST(EncodedDictionaryTest, FindsNulsAndBytesThatAreNotUtf8AtAnyPlace) {
+  for (std::size_t size = 1; size <= 50; ++size) {
+    const std::string good(size, 'x');
+    EncodedDictionary message;
+    EXPECT_TRUE(message.set(good, good));
+    for (std::size_t place = 0; place < size; ++place) {
+      for (const char bad : {'\0', '\xFF', '\x80'}) {
+        std::string text = good;
+        text[place] = bad;
+        EXPECT_FALSE(message.set(text, 1)) << size << " " << place;
+        EXPECT_FALSE(message.set("text", text)) << size << " " << place;
+      }
+    }
+    EXPECT_EQ(message.size(), 1U);
+    EXPECT_TRUE(message.set(good + "\xC3\xA4", "\xC3\xA4"));
+  }
+}
+
+// Keys that differ in one byte, at each place.
+TEST(EncodedDictionaryTest, KeysThatDifferInOneByteAreDifferent) {
+  for (std::size_t size = 1; size <= 50; ++size) {
+    EncodedDictionary message;
+    Dictionary expected;
+    for (std::size_t place = 0; place < size; ++place) {
+      std::string key(size, 'x');
+      key[place] = 'y';
+      message.set(key, static_cast<std::int64_t>(place));
+      expected.set(key, static_cast<std::int64_t>(place));
+    }
+    EXPECT_EQ(message.size(), size);
+    EXPECT_EQ(frameOf(message), frameOf(expected));
+  }
+}
+
 // 32 dictionaries and the variants in them.
 TEST(EncodedDictionaryTest, NestingIsTakenUpToTheWiresLimit) {
   EncodedDictionary message;

@@ -13,16 +13,28 @@
 // end. The code is inline because the caller's thread pays for every function call.
 namespace halvox::client {
 
+inline constexpr std::uint64_t kEachHighBit = 0x8080808080808080;
+
+// Sets the high bit of each byte that is a NUL or not ASCII, and sometimes that of the byte after a
+// NUL.
+inline std::uint64_t highBits(std::uint64_t word) {
+  constexpr std::uint64_t kEachByte = 0x0101010101010101;
+  return word | (word - kEachByte);  // subtracting one from a NUL sets its high bit
+}
+
+template <typename Number>
+inline Number load(const char* from) {
+  Number number;
+  std::memcpy(&number, from, sizeof number);
+  return number;
+}
+
 // Returns true for ASCII without NUL, which nearly all texts are. Saves them the call of the full
 // test, which checks the last bytes one by one.
 inline bool isPlainText(std::string_view text) {
-  constexpr std::uint64_t kEachByte = 0x0101010101010101;
-  constexpr std::uint64_t kEachHighBit = 0x8080808080808080;
   constexpr std::size_t kWord = sizeof(std::uint64_t);
   const auto signs = [&](std::size_t at) {
-    std::uint64_t word = 0;
-    std::memcpy(&word, text.data() + at, kWord);
-    return word | (word - kEachByte);  // subtracting one from a NUL sets its high bit
+    return highBits(load<std::uint64_t>(text.data() + at));
   };
   if (text.size() < kWord) {
     bool plain = true;
