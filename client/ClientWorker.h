@@ -148,7 +148,7 @@ class ClientWorker {
   FrameRing ring_;
   const pid_t process_;
   platform::linux_::UniqueFd wakeUp_;
-  std::atomic<bool> asleep_{false};  // sequentially consistent with the slots of the ring
+  std::atomic<bool> asleep_{false};  // sequentially consistent with the frames of the ring
   std::atomic<bool> closing_{false};
   std::atomic<bool> connected_{false};
   std::atomic<std::uint64_t> dropped_{0};

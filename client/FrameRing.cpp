@@ -1,7 +1,6 @@
 #include "client/FrameRing.h"
 
 #include <algorithm>
-#include <bit>
 #include <cstring>
 #include <new>
 #include <utility>
@@ -18,7 +17,10 @@ constexpr std::size_t kMostFrames = std::size_t{1} << 24U;
 // page fault would cost an audio thread more than the whole message.
 constexpr std::size_t kTouchedBytes = std::size_t{256} * 1024;
 
-constexpr std::uint64_t kChange = std::uint64_t{1} << 32U;
+// The high half of a word counts, the low half is the number of a cell + 1, or 0 for none.
+constexpr std::uint64_t kOneMore = std::uint64_t{1} << 32U;
+constexpr std::uint64_t kCountMask = ~std::uint64_t{UINT32_MAX};
+std::uint32_t countOf(std::uint64_t word) { return static_cast<std::uint32_t>(word >> 32U); }
 
 }  // namespace
 
@@ -32,19 +34,23 @@ class FrameRing::ChainSource final : public SegmentSource {
     if (chain_.first != kNoCell) ring_.pushCells(chain_);
   }
 
-  Segment next() override {
+  [[gnu::hot]] Segment next() override {
     const CellNumber cell = ring_.popCell();
     if (cell == kNoCell) return {};
-    if (chain_.first == kNoCell) {
+    char* const begin = ring_.cell(cell);
+    char* const end = begin + kCellBytes;
+    const bool isFirst = chain_.first == kNoCell;
+    if (isFirst) {
       chain_.first = cell;
     } else {
       ring_.next(chain_.last).store(cell, std::memory_order_relaxed);
     }
     chain_.last = cell;
-    return {ring_.cell(cell), ring_.cell(cell) + kCellBytes};
+    return {isFirst ? begin + sizeof(FrameHead) : begin, end};
   }
-  // Leaves the cells to the caller.
-  CellNumber release() { return std::exchange(chain_.first, kNoCell); }
+  [[nodiscard]] CellNumber first() const { return chain_.first; }
+  // Leaves the cells to the ring.
+  void release() { chain_ = {}; }
 
  private:
   FrameRing& ring_;
@@ -63,59 +69,76 @@ std::unique_ptr<char, FrameRing::Unmap> FrameRing::map(std::size_t bytes) {
 }
 
 FrameRing::FrameRing(std::size_t maxFrames, std::size_t maxBytes)
-    : maxFrames_(std::clamp<std::size_t>(maxFrames, 1, kMostFrames)),
-      mask_(std::bit_ceil(maxFrames_) - 1),
+    : maxFrames_(static_cast<std::uint32_t>(std::clamp<std::size_t>(maxFrames, 1, kMostFrames))),
       cells_(
           static_cast<CellNumber>((std::min(maxBytes, kMostBytes) + kCellBytes - 1) / kCellBytes)),
-      slots_(std::make_unique<Slot[]>(mask_ + 1)),
       memory_(map(std::size_t{cells_} * kCellBytes)),
       next_(std::make_unique<std::atomic<CellNumber>[]>(cells_)) {}
 
 EncodeOutcome FrameRing::tryPush(const MessageView& message) { return push(message); }
 
-EncodeOutcome FrameRing::tryPush(const EncodedMessageView& message) { return push(message); }
+[[gnu::hot]] EncodeOutcome FrameRing::tryPush(const EncodedMessageView& message) {
+  return push(message);
+}
 
 template <typename Content>
-EncodeOutcome FrameRing::push(const BasicMessageView<Content>& message) {
-  // reservePosition() tests this again. The test here saves encoding the message while the ring is
-  // full.
-  if (isFullAt(tail_.load(std::memory_order_relaxed))) return EncodeOutcome::kNoRoom;
+[[gnu::hot]] EncodeOutcome FrameRing::push(const BasicMessageView<Content>& message) {
+  // publish() tests this again. The test here saves encoding the message while the ring is full.
+  if (isFull(newest_.load(std::memory_order_relaxed))) return EncodeOutcome::kNoRoom;
   ChainSource cells(*this);
   SegmentWriter writer(cells);
   const EncodeOutcome outcome = encodeBody(writer, message);
   if (outcome != EncodeOutcome::kDone) return outcome;
-  std::uint64_t position = 0;
-  if (!reservePosition(position)) return EncodeOutcome::kNoRoom;
-  Slot& free = slot(position);
-  free.firstCell = cells.release();
-  free.bytes = static_cast<std::uint32_t>(writer.position());
-  free.ready.store(position + 1, std::memory_order_seq_cst);
+  if (!publish(cells.first(), writer.position())) return EncodeOutcome::kNoRoom;
+  cells.release();
   return EncodeOutcome::kDone;
 }
 
-bool FrameRing::isFullAt(std::uint64_t position) const {
-  // An outdated position may be below `released_`.
-  const std::uint64_t released = released_.load(std::memory_order_acquire);
-  return position >= released && position - released >= maxFrames_;
+FrameRing::FrameHead FrameRing::headOf(CellNumber number) const {
+  FrameHead head;
+  std::memcpy(&head, cell(number), sizeof head);
+  return head;
 }
 
-bool FrameRing::reservePosition(std::uint64_t& position) {
-  position = tail_.load(std::memory_order_relaxed);
+void FrameRing::setHead(CellNumber number, const FrameHead& head) const {
+  std::memcpy(cell(number), &head, sizeof head);
+}
+
+bool FrameRing::isFull(std::uint64_t newest) const {
+  // An outdated count may be below the released ones; the difference is then negative.
+  const auto released = static_cast<std::uint32_t>(released_.load(std::memory_order_relaxed));
+  return static_cast<std::int32_t>(countOf(newest) - released) >=
+         static_cast<std::int32_t>(maxFrames_);
+}
+
+[[gnu::hot]] bool FrameRing::publish(CellNumber first, std::size_t bytes) {
+  std::uint64_t newest = newest_.load(std::memory_order_relaxed);
+  std::uint64_t published = 0;
   do {
-    if (isFullAt(position)) return false;
-  } while (!tail_.compare_exchange_weak(position, position + 1, std::memory_order_seq_cst,
-                                        std::memory_order_relaxed));
+    if (isFull(newest)) return false;
+    const CellNumber before = static_cast<std::uint32_t>(newest) - 1U;  // kNoCell if there is none
+    setHead(first, {.bytes = static_cast<std::uint32_t>(bytes), .neighbour = before});
+    published = (newest & kCountMask) + kOneMore + (first + std::uint64_t{1});
+  } while (!newest_.compare_exchange_weak(newest, published, std::memory_order_seq_cst,
+                                          std::memory_order_relaxed));
   return true;
 }
 
-FrameRing::CellNumber FrameRing::popCell() {
+std::uint64_t FrameRing::tail() const {
+  // Fewer frames than half of the range of the count are in the ring.
+  const std::uint64_t released = released_.load(std::memory_order_acquire);
+  const std::uint32_t count = countOf(newest_.load(std::memory_order_seq_cst));
+  return released + static_cast<std::uint32_t>(count - static_cast<std::uint32_t>(released));
+}
+
+[[gnu::hot]] FrameRing::CellNumber FrameRing::popCell() {
   std::uint64_t top = free_.load(std::memory_order_acquire);
   while (static_cast<std::uint32_t>(top) != 0) {
     const CellNumber first = static_cast<std::uint32_t>(top) - 1;
     // If another thread takes this cell meanwhile, the number read here is wrong, and the exchange
     // fails.
     const CellNumber second = next(first).load(std::memory_order_relaxed);
-    const std::uint64_t rest = (top & ~std::uint64_t{UINT32_MAX}) + kChange + (second + 1U);
+    const std::uint64_t rest = (top & kCountMask) + kOneMore + (second + 1U);
     if (free_.compare_exchange_weak(top, rest, std::memory_order_acquire)) return first;
   }
   if (fresh_.load(std::memory_order_relaxed) >= cells_) return kNoCell;
@@ -131,33 +154,47 @@ void FrameRing::pushCells(const Chain& chain) {
   do {
     // If no cell is free, this stores kNoCell, because kNoCell + 1 is 0.
     next(chain.last).store(static_cast<std::uint32_t>(top) - 1U, std::memory_order_relaxed);
-    pushed = (top & ~std::uint64_t{UINT32_MAX}) + kChange + (chain.first + std::uint64_t{1});
+    pushed = (top & kCountMask) + kOneMore + (chain.first + std::uint64_t{1});
   } while (!free_.compare_exchange_weak(top, pushed, std::memory_order_acq_rel,
                                         std::memory_order_relaxed));
 }
 
-bool FrameRing::isReady() const {
-  return slot(head_).ready.load(std::memory_order_seq_cst) == head_ + 1;
+// Takes over what the producers have published since the last call.
+bool FrameRing::takeList() {
+  // The load alone keeps the line of the word with the producers while there is nothing.
+  if (static_cast<std::uint32_t>(newest_.load(std::memory_order_seq_cst)) == 0) return false;
+  const std::uint64_t newest = newest_.fetch_and(kCountMask, std::memory_order_acq_rel);
+  CellNumber number = static_cast<std::uint32_t>(newest) - 1U;
+  while (number != kNoCell) {
+    FrameHead head = headOf(number);
+    const CellNumber before = std::exchange(head.neighbour, oldest_);
+    setHead(number, head);
+    oldest_ = std::exchange(number, before);
+  }
+  return true;
 }
 
 void FrameRing::take(char* to) {
-  const Slot& oldest = slot(head_);
-  std::size_t rest = oldest.bytes;
-  CellNumber number = oldest.firstCell;
+  const FrameHead head = headOf(oldest_);
+  CellNumber number = std::exchange(oldest_, head.neighbour);
   if (taken_.first == kNoCell) {
     taken_.first = number;
   } else {
     next(taken_.last).store(number, std::memory_order_relaxed);
   }
+  const char* from = cell(number) + sizeof head;
+  std::size_t rest = head.bytes;
   for (;;) {
-    const std::size_t part = std::min(rest, kCellBytes);
+    const std::size_t part =
+        std::min(rest, static_cast<std::size_t>(cell(number) + kCellBytes - from));
     if (to != nullptr) {
-      std::memcpy(to, cell(number), part);
+      std::memcpy(to, from, part);
       to += part;
     }
     rest -= part;
     if (rest == 0) break;
     number = next(number).load(std::memory_order_relaxed);
+    from = cell(number);
   }
   taken_.last = number;
   ++head_;

@@ -14,24 +14,24 @@ namespace halvox::client {
 // ring is a body that is ready for the wire; its header, the same bytes for every message, is added
 // when the frame is sent.
 //
-//                   pop                  publish                   take
-//   free cells ─────────────► a frame ──────────────► slots ─────────────► the consumer
-//       ▲                                                                      │
-//       └──────────────────────────── release(), many at once ─────────────────┘
+//                   pop                  publish                 isReady, take
+//   free cells ─────────────► a frame ──────────────► newest first ─────────────► the consumer
+//       ▲                                                                             │
+//       └───────────────────────────── release(), many at once ───────────────────────┘
 //
-// The memory of frames is cells of 1 KiB. A frame takes as many as it needs, and needs no other
+// The memory of frames is cells of 512 bytes. A frame takes as many as it needs, and needs no other
 // memory. Freed cells are used again first: a client whose thread keeps up touches only a few of
-// them. Each complete frame gets a position, which sets the order of the frames, and the slot of
-// that position.
+// them. Each complete frame refers to the one that was complete before it. The consumer takes the
+// whole list at once and reverses it.
 //
 // A producer takes no lock, allocates nothing and makes no system call. It repeats a step only if
 // another thread has completed the same step meanwhile. A thread that is interrupted therefore
-// cannot hold it up. A producer that is interrupted between its position and its slot delays the
-// consumer, but no other producer.
+// cannot hold up any other.
 //
 // Rejected: a list of dictionaries, encoded by the consumer. The program's next change of a
 // dictionary would then have to copy it, on the audio thread. Also rejected: one ring of bytes. All
-// of it would be in memory after the first lap, and 8 MiB for each audio process are too much.
+// of it would be in memory after the first lap, which is too much for each audio process. Slots in
+// the order of the frames, which were here before, took one more atomic exchange for each message.
 class FrameRing {
  public:
   // Throws std::bad_alloc.
@@ -44,15 +44,15 @@ class FrameRing {
   EncodeOutcome tryPush(const MessageView& message);
   EncodeOutcome tryPush(const EncodedMessageView& message);
   // The number of frames accepted so far, which is the position of the next one.
-  [[nodiscard]] std::uint64_t tail() const { return tail_.load(std::memory_order_seq_cst); }
+  [[nodiscard]] std::uint64_t tail() const;
 
   // Only the consumer may call the following functions.
   // The position of the oldest frame in the ring.
   [[nodiscard]] std::uint64_t head() const { return head_; }
-  // Returns true if there is a frame and its producer has finished writing it.
-  [[nodiscard]] bool isReady() const;
-  // The size of the oldest frame. Call this and take() only if isReady().
-  [[nodiscard]] std::size_t frontBytes() const { return slot(head_).bytes; }
+  // Returns true if there is a frame.
+  [[nodiscard]] bool isReady() { return oldest_ != kNoCell || takeList(); }
+  // The size of the oldest frame. Call this and take() only after isReady() has returned true.
+  [[nodiscard]] std::size_t frontBytes() const { return headOf(oldest_).bytes; }
   // Copies the oldest frame to `to`, or nowhere if that is null, and removes it.
   void take(char* to);
   // Gives the room of removed frames back to the producers.
@@ -61,15 +61,13 @@ class FrameRing {
  private:
   using CellNumber = std::uint32_t;
   static constexpr CellNumber kNoCell = std::numeric_limits<CellNumber>::max();
-  static constexpr std::size_t kCellBytes = 1024;
+  static constexpr std::size_t kCellBytes = 512;
 
-  struct Slot {
-    // Position + 1 once the frame is complete. Orders the writing of the frame before its reading.
-    // Sequentially consistent with the consumer's announcement that it goes to sleep: the producer
-    // sees the announcement, or the consumer sees the frame.
-    std::atomic<std::uint64_t> ready{0};
-    CellNumber firstCell = kNoCell;
-    std::uint32_t bytes = 0;
+  // At the start of a frame's first cell.
+  struct FrameHead {
+    std::uint32_t bytes = 0;  // of the frame, without this
+    // The first cell of the frame before this one; in the consumer's list, of the one after it.
+    CellNumber neighbour = kNoCell;
   };
   // Cells in the order of their `next` numbers.
   struct Chain {
@@ -85,20 +83,20 @@ class FrameRing {
   template <typename Content>
   EncodeOutcome push(const BasicMessageView<Content>& message);
   static std::unique_ptr<char, Unmap> map(std::size_t bytes);
-  [[nodiscard]] Slot& slot(std::uint64_t position) const { return slots_[position & mask_]; }
   [[nodiscard]] char* cell(CellNumber number) const {
     return memory_.get() + std::size_t{number} * kCellBytes;
   }
+  [[nodiscard]] FrameHead headOf(CellNumber number) const;
+  void setHead(CellNumber number, const FrameHead& head) const;
   [[nodiscard]] std::atomic<CellNumber>& next(CellNumber number) const { return next_[number]; }
   CellNumber popCell();
   void pushCells(const Chain& chain);
-  [[nodiscard]] bool isFullAt(std::uint64_t position) const;
-  [[nodiscard]] bool reservePosition(std::uint64_t& position);
+  [[nodiscard]] bool isFull(std::uint64_t newest) const;
+  [[nodiscard]] bool publish(CellNumber first, std::size_t bytes);
+  bool takeList();
 
-  const std::uint64_t maxFrames_;
-  const std::uint64_t mask_;
+  const std::uint32_t maxFrames_;
   const CellNumber cells_;
-  const std::unique_ptr<Slot[]> slots_;
   const std::unique_ptr<char, Unmap> memory_;
   const std::unique_ptr<std::atomic<CellNumber>[]> next_;  // the cell after each cell
   // The following are on a cache line each: producers write the first three, the consumer the
@@ -108,11 +106,15 @@ class FrameRing {
   alignas(64) std::atomic<std::uint64_t> free_{0};
   // All cells from this one on have never been used.
   alignas(64) std::atomic<CellNumber> fresh_{0};
-  alignas(64) std::atomic<std::uint64_t> tail_{0};
-  // All positions below this one have been released. Acquire and release order the emptying of a
-  // slot before its reuse.
+  // The low half is the first cell + 1 of the newest frame, or 0 if the consumer has taken all. The
+  // high half counts the frames. Orders the writing of a frame before its reading. Sequentially
+  // consistent with the consumer's announcement that it goes to sleep: the producer sees the
+  // announcement, or the consumer sees the frame.
+  alignas(64) std::atomic<std::uint64_t> newest_{0};
+  // All positions below this one have been released.
   alignas(64) std::atomic<std::uint64_t> released_{0};
   alignas(64) std::uint64_t head_ = 0;
+  CellNumber oldest_ = kNoCell;  // the consumer's list, in the order of the frames
   Chain taken_;
 };
 

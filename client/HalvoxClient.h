@@ -55,9 +55,9 @@ struct Options {
   // listens.
   std::string socketPath;
   // Bounds of the messages that wait for the client's thread, in number and in bytes of memory. A
-  // message takes its size on the wire, rounded up to a multiple of 1 KiB. When either bound is
-  // reached, send() drops the message and counts it. The bounds themselves are at most 16,777,216
-  // messages and 1 GiB.
+  // message takes the size of its body on the wire plus 8 bytes, rounded up to a multiple of 512.
+  // When either bound is reached, send() drops the message and counts it. The bounds themselves are
+  // at most 16,777,216 messages and 1 GiB.
   std::size_t maxPendingMessages = 8192;
   std::size_t maxPendingBytes = 8U << 20U;
   // The longest time that making a connection may take.

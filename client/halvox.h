@@ -230,7 +230,7 @@ typedef struct halvox_options {
   size_t size;
   const char* socket_path;       /* NULL: the usual places, see halvox_default_socket_path() */
   uint64_t max_pending_messages; /* messages that may wait for the client's thread; 0: 8192 */
-  uint64_t max_pending_bytes;    /* their size on the wire, each rounded up to KiB; 0: 8 MiB */
+  uint64_t max_pending_bytes;    /* their memory, each a multiple of 512; 0: 8 MiB */
   uint32_t request_timeout_ms;   /* how long making a connection may take; 0: 5000 */
   uint32_t reconnect_min_ms;     /* first pause between attempts to connect; 0: 50 */
   uint32_t reconnect_max_ms;     /* longest pause, after several attempts; 0: 2000 */
