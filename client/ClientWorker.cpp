@@ -86,7 +86,7 @@ ClientWorker::~ClientWorker() {
 }
 
 template <typename Content>
-bool ClientWorker::push(const BasicMessageView<Content>& message) {
+[[gnu::hot]] bool ClientWorker::push(const BasicMessageView<Content>& message) {
   // Relaxed is enough: a program that sends while it destroys its client has a data race anyway.
   const bool isClosing = closing_.load(std::memory_order_relaxed);
   switch (isClosing ? EncodeOutcome::kNoRoom : ring_.tryPush(message)) {
@@ -106,7 +106,7 @@ bool ClientWorker::push(const BasicMessageView<Content>& message) {
 
 bool ClientWorker::send(const MessageView& message) { return push(message); }
 
-bool ClientWorker::send(const EncodedMessageView& message) { return push(message); }
+[[gnu::hot]] bool ClientWorker::send(const EncodedMessageView& message) { return push(message); }
 
 void ClientWorker::post(SessionOperation operation) {
   {

@@ -51,17 +51,19 @@ bool HalvoxClient::sendTo(std::span<const ReporterID> ids, const Dictionary& mes
   return impl_->worker.send(MessageView{ids, message, category, type});
 }
 
-bool HalvoxClient::send(ReporterID id, const EncodedDictionary& message, Category category,
-                        EventType type) {
+[[gnu::hot]] bool HalvoxClient::send(ReporterID id, const EncodedDictionary& message,
+                                     Category category, EventType type) {
   return sendTo(std::span(&id, 1), message, category, type);
 }
 
-bool HalvoxClient::sendTo(std::span<const ReporterID> ids, const EncodedDictionary& message,
-                          Category category, EventType type) {
+[[gnu::hot]] bool HalvoxClient::sendTo(std::span<const ReporterID> ids,
+                                       const EncodedDictionary& message, Category category,
+                                       EventType type) {
   return impl_->worker.send(EncodedMessageView{ids, message, category, type});
 }
 
-bool HalvoxClient::sendToAll(const EncodedDictionary& message, Category category, EventType type) {
+[[gnu::hot]] bool HalvoxClient::sendToAll(const EncodedDictionary& message, Category category,
+                                          EventType type) {
   return impl_->worker.send(EncodedMessageView{std::nullopt, message, category, type});
 }
 

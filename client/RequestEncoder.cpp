@@ -101,8 +101,8 @@ void writeFrame(SegmentWriter& writer, const Header& header, const Body& body) {
 
 // ---- Requests
 
-void appendRecipients(SegmentWriter& writer,
-                      const std::optional<std::span<const ReporterID>>& recipients) {
+[[gnu::hot]] void appendRecipients(SegmentWriter& writer,
+                                   const std::optional<std::span<const ReporterID>>& recipients) {
   char* const outer = writer.length();
   const std::size_t start = writer.position();
   if (recipients) {
@@ -187,7 +187,7 @@ EncodeOutcome encodeBody(SegmentWriter& writer, const MessageView& message) {
   return outcomeOf(writer, hasForm);
 }
 
-EncodeOutcome encodeBody(SegmentWriter& writer, const EncodedMessageView& message) {
+[[gnu::hot]] EncodeOutcome encodeBody(SegmentWriter& writer, const EncodedMessageView& message) {
   const WireDictionary content = message.message.wireForm();
   const std::size_t bytes = content.entries.size();
   if (1 + content.levels > dbus::kMaxNesting || bytes > dbus::kMaxArrayBytes) {

@@ -9,7 +9,7 @@ constexpr std::size_t kFirstSegmentBytes = 1024;
 
 }  // namespace
 
-void SegmentWriter::bytes(const void* from, std::size_t size) {
+[[gnu::hot]] void SegmentWriter::bytes(const void* from, std::size_t size) {
   const char* rest = static_cast<const char*>(from);
   while (size > 0) {
     if (at_ == end_ && !extend()) return;
@@ -21,7 +21,7 @@ void SegmentWriter::bytes(const void* from, std::size_t size) {
   }
 }
 
-bool SegmentWriter::extend() {
+[[gnu::hot]] bool SegmentWriter::extend() {
   if (full_) return false;
   const Segment segment = source_.next();
   if (segment.begin == segment.end) {

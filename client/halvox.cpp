@@ -315,17 +315,17 @@ halvox_result halvox_client_destroy_session(halvox_client* client, int64_t id) {
   return done([&] { client->client.destroySession(id); });
 }
 
-halvox_result halvox_client_send(halvox_client* client, int64_t id,
-                                 const halvox_dictionary* message, uint32_t category,
-                                 uint16_t type) {
+[[gnu::hot]] halvox_result halvox_client_send(halvox_client* client, int64_t id,
+                                              const halvox_dictionary* message, uint32_t category,
+                                              uint16_t type) {
   if (client == nullptr || message == nullptr) return HALVOX_BAD_ARGUMENT;
   return guarded(
       [&] { return sent(client->client.send(id, message->dictionary, category, type)); });
 }
 
-halvox_result halvox_client_send_to(halvox_client* client, const int64_t* ids, size_t count,
-                                    const halvox_dictionary* message, uint32_t category,
-                                    uint16_t type) {
+[[gnu::hot]] halvox_result halvox_client_send_to(halvox_client* client, const int64_t* ids,
+                                                 size_t count, const halvox_dictionary* message,
+                                                 uint32_t category, uint16_t type) {
   const bool idsAreGood = ids != nullptr || count == 0;
   if (client == nullptr || message == nullptr || !idsAreGood) return HALVOX_BAD_ARGUMENT;
   return guarded([&] {
@@ -333,8 +333,9 @@ halvox_result halvox_client_send_to(halvox_client* client, const int64_t* ids, s
   });
 }
 
-halvox_result halvox_client_send_to_all(halvox_client* client, const halvox_dictionary* message,
-                                        uint32_t category, uint16_t type) {
+[[gnu::hot]] halvox_result halvox_client_send_to_all(halvox_client* client,
+                                                     const halvox_dictionary* message,
+                                                     uint32_t category, uint16_t type) {
   if (client == nullptr || message == nullptr) return HALVOX_BAD_ARGUMENT;
   return guarded(
       [&] { return sent(client->client.sendToAll(message->dictionary, category, type)); });
