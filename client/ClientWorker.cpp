@@ -61,14 +61,14 @@ ClientWorker::ClientWorker(Options options)
       pause_(options_.reconnectMin) {
   // The program's signals must go to its own threads, and a thread inherits the signal mask.
   const platform::linux_::SignalsBlocked blocked;
-  thread_ = std::jthread([this] { run(); });
+  thread_.start([this] { run(); });
 }
 
 ClientWorker::~ClientWorker() {
   if (!isOwnProcess()) {
     // After fork(), the thread exists only in the parent, and only the parent may use the
-    // connection. There is nothing to join or detach here, so its object is abandoned.
-    static_cast<void>(std::make_unique<std::jthread>(std::move(thread_)).release());
+    // connection. There is nothing to join here.
+    thread_.abandon();
     return;
   }
   closing_.store(true, std::memory_order_relaxed);
@@ -123,7 +123,7 @@ void ClientWorker::post(SessionOperation operation) {
 
 bool ClientWorker::flush(std::chrono::milliseconds timeout) {
   // This thread runs the connection handler, and would have to do the work of the flush.
-  if (std::this_thread::get_id() == thread_.get_id()) return false;
+  if (thread_.isCurrent()) return false;
   const TimePoint deadline =
       std::chrono::steady_clock::now() + std::min<std::chrono::milliseconds>(timeout, kLongestWait);
   if (!isOwnProcess()) return false;

@@ -8,12 +8,12 @@
 #include <memory>
 #include <optional>
 #include <string>
-#include <thread>
 #include <variant>
 #include <vector>
 
 #include <sys/types.h>
 
+#include "client/ClientThread.h"
 #include "client/FrameRing.h"
 #include "client/HalvoxClient.h"
 #include "client/RequestEncoder.h"
@@ -204,7 +204,7 @@ class ClientWorker {
   std::size_t unanswered_ = 0;
   std::size_t openBytes_ = 0;
   ServiceStream stream_;
-  std::jthread thread_;
+  ClientThread thread_;
 };
 
 }  // namespace halvox::client

@@ -1,0 +1,39 @@
+#pragma once
+
+#include <functional>
+
+#include <pthread.h>
+
+namespace halvox::client {
+
+// The thread of a client, with a stack of 512 KiB. The default stack of 8 MiB would be in memory as
+// a whole in a program that has called mlockall(MCL_FUTURE), and such programs are what the client
+// is for. If the C library needs more, because the program has many thread-local variables, the
+// thread has the default size.
+//
+//   empty ──start()──► running ──destruction──► joined
+//                         └──────abandon()────► empty
+//
+// The owner's threads may call isCurrent() at the same time; everything else belongs to one thread.
+class ClientThread {
+ public:
+  ClientThread() = default;
+  // Waits for the end of the work.
+  ~ClientThread();
+  ClientThread(const ClientThread&) = delete;
+  ClientThread& operator=(const ClientThread&) = delete;
+
+  // Runs the work on a new thread. Call it once. Throws std::system_error if no thread can be
+  // started, and std::bad_alloc. No exception may leave `work`.
+  void start(std::function<void()> work);
+  // Returns true on the thread itself, while it runs.
+  [[nodiscard]] bool isCurrent() const;
+  // Forgets the thread, which does not exist in a child process after fork().
+  void abandon() { isRunning_ = false; }
+
+ private:
+  bool isRunning_ = false;
+  pthread_t thread_{};
+};
+
+}  // namespace halvox::client
