@@ -230,7 +230,9 @@ TEST_F(HalvoxClientTest, ManyThreadsKeepTheirOrderAndNothingIsLostOrDoubled) {
 }
 
 TEST_F(HalvoxClientTest, TakesMessagesOfMegabytesAndDropsThoseLargerThanItsBound) {
-  HalvoxClient client(options());
+  Options large = options();
+  large.maxPendingBytes = 8U << 20U;
+  HalvoxClient client(large);
 
   EXPECT_TRUE(client.send(7, {{"n", 1}, {"text", std::string(6'000'000, 'x')}}, 4, 1));
   ASSERT_TRUE(client.flush(kPatience));

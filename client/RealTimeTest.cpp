@@ -7,6 +7,7 @@
 #include <csignal>
 #include <cstddef>
 #include <cstdint>
+#include <fstream>
 #include <memory>
 #include <thread>
 
@@ -15,9 +16,12 @@
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <pthread.h>
+#include <sys/mman.h>
 #include <sys/prctl.h>
 #include <sys/syscall.h>
+#include <sys/wait.h>
 #include <ucontext.h>
+#include <unistd.h>
 
 #include "client/halvox.h"
 #include "client/testing/TestService.h"
@@ -231,6 +235,37 @@ TEST_F(RealTimeTest, SendingWithoutAServiceMakesNoneEither) {
       halvox::client::eventually([&] { return !halvox_client_is_connected(client_.get()); }));
 
   expectNothing(count([&] { sendMany(1000); }));
+}
+
+// Bytes of this process that are in memory.
+std::size_t residentBytes() {
+  std::size_t size = 0;
+  std::size_t resident = 0;
+  std::ifstream("/proc/self/statm") >> size >> resident;
+  return resident * static_cast<std::size_t>(sysconf(_SC_PAGESIZE));
+}
+
+// Audio programs lock their memory. The usual limit for that is 8 MiB, and everything that a thread
+// or a client maps counts.
+TEST(LockedMemoryTest, AClientLeavesMostOfTheUsualLimitToItsProgram) {
+  constexpr int kCannotLock = 2;
+  const pid_t child = fork();
+  if (child == 0) {
+    if (mlockall(MCL_CURRENT | MCL_FUTURE) != 0) _exit(kCannotLock);
+    halvox_options options{};
+    options.size = sizeof options;
+    options.socket_path = "/nonexistent/socket";
+    const std::size_t before = residentBytes();
+    halvox_client* client = halvox_client_new(&options);
+    const std::size_t taken = residentBytes() - before;
+    _exit(client != nullptr && taken < std::size_t{6} << 20U ? 0 : 1);
+  }
+  int status = -1;
+  ASSERT_EQ(waitpid(child, &status, 0), child);
+  ASSERT_TRUE(WIFEXITED(status));
+  if (WEXITSTATUS(status) == kCannotLock) GTEST_SKIP() << "this user may not lock memory";
+
+  EXPECT_EQ(WEXITSTATUS(status), 0);
 }
 
 }  // namespace

@@ -230,7 +230,7 @@ typedef struct halvox_options {
   size_t size;
   const char* socket_path;       /* NULL: the usual places, see halvox_default_socket_path() */
   uint64_t max_pending_messages; /* messages that may wait for the client's thread; 0: 8192 */
-  uint64_t max_pending_bytes;    /* their memory, each a multiple of 512; 0: 8 MiB */
+  uint64_t max_pending_bytes;    /* their memory, each a multiple of 512; 0: 4 MiB */
   uint32_t request_timeout_ms;   /* how long making a connection may take; 0: 5000 */
   uint32_t reconnect_min_ms;     /* first pause between attempts to connect; 0: 50 */
   uint32_t reconnect_max_ms;     /* longest pause, after several attempts; 0: 2000 */
@@ -252,7 +252,8 @@ typedef struct halvox_counters {
 } halvox_counters;
 
 /* Called when the connection is made (true) or lost (false), on the client's thread, which sends
- * nothing until the handler returns. It must not block or call halvox_client_free(). */
+ * nothing until the handler returns and has a stack of 512 KiB. It must not block or call
+ * halvox_client_free(). */
 typedef void (*halvox_connection_handler)(bool connected, void* user_data);
 
 /* Writes the path of the socket where a client with default options looks for the service now:
@@ -268,7 +269,9 @@ typedef void (*halvox_connection_handler)(bool connected, void* user_data);
  * the length as halvox_category_name() does. */
 HALVOX_API size_t halvox_default_socket_path(char* buffer, size_t size);
 
-/* Starts a client with its thread. Does not wait for the service, and succeeds without one.
+/* Starts a client with its thread. Does not wait for the service, and succeeds without one. Takes
+ * about 0.8 MiB of memory. In a program that has called mlockall(MCL_FUTURE), takes
+ * max_pending_bytes and another 0.6 MiB, which count towards the program's limit of locked memory.
  * `options` may be NULL for all defaults. The caller owns the client and releases it with
  * halvox_client_free(). Returns NULL if there is not enough memory or the thread cannot be started.
  * */
