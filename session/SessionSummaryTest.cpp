@@ -64,6 +64,25 @@ TEST_F(SessionSummaryTest, NumbersAreInTheirShortestForm) {
   EXPECT_EQ(*session_->createSummaryEventForSession()->find("n"), Value("0.1,48000,-7,0.33333334"));
 }
 
+TEST_F(SessionSummaryTest, ValuesThatRepeatAreThereEachTime) {
+  const Dictionary repeated{{"empty", ""}, {"comma", "a,"}, {"number", 0.5}, {"flag", true}};
+  for (int number = 1; number <= 3; ++number) {
+    Dictionary message = repeated;
+    message.set("different", number);
+    send(message);
+  }
+  send({{"number", 7}});
+  send({{"number", 7}, {"different", 4}});
+
+  const Dictionary summary = *session_->createSummaryEventForSession();
+
+  EXPECT_EQ(*summary.find("empty"), Value(",,"));
+  EXPECT_EQ(*summary.find("comma"), Value("a,,a,,a,"));
+  EXPECT_EQ(*summary.find("number"), Value("0.5,0.5,0.5,7,7"));
+  EXPECT_EQ(*summary.find("flag"), Value("1,1,1"));
+  EXPECT_EQ(*summary.find("different"), Value("1,2,3,4"));
+}
+
 TEST_F(SessionSummaryTest, ContainersAreShownAsTheLogShowsThem) {
   send({{"list", platform::Array{1, "x"}}});
   send({{"list", Dictionary{{"k", 2}}}});

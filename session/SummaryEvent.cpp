@@ -25,7 +25,7 @@ void appendText(std::string& text, const Value& value) {
 
 // A message may use this key too. Its values then follow the service type.
 SummaryEvent::SummaryEvent(AudioServiceType serviceType) {
-  appendText(columnOf(kServiceTypeKey).text, number(serviceType));
+  append(columnOf(kServiceTypeKey), number(serviceType));
 }
 
 void SummaryEvent::add(const Dictionary& message) {
@@ -33,14 +33,27 @@ void SummaryEvent::add(const Dictionary& message) {
     const std::size_t known = columns_.size();
     Column& column = columnOf(entry.key);
     if (columns_.size() == known) column.text += ',';
-    appendText(column.text, entry.value);
+    append(column, entry.value);
   }
+}
+
+// Most values of a session repeat the one before. Copying its text costs less than making it again.
+void SummaryEvent::append(Column& column, const Value& value) {
+  const std::size_t begin = column.text.size();
+  if (begin > 0 && column.last.isIdenticalTo(value)) {
+    const std::size_t end = begin - 1;  // before the comma
+    column.text.append(column.text, column.lastBegin, end - column.lastBegin);
+  } else {
+    appendText(column.text, value);
+    column.last = value;
+  }
+  column.lastBegin = begin;
 }
 
 SummaryEvent::Column& SummaryEvent::columnOf(const Key& key) {
   if (likely_ >= columns_.size() || !(columns_[likely_].key == key)) {
     const auto [place, isNew] = positions_.try_emplace(key, columns_.size());
-    if (isNew) columns_.push_back({key, {}});
+    if (isNew) columns_.push_back({.key = key, .text = {}, .last = {}});
     likely_ = place->second;
   }
   return columns_[likely_++];

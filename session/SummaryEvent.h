@@ -30,12 +30,15 @@ class SummaryEvent {
   struct Column {
     platform::Key key;
     std::string text;
+    platform::Value last;       // the last value of the text
+    std::size_t lastBegin = 0;  // where its text begins
   };
   struct KeyHash {
     std::size_t operator()(const platform::Key& key) const { return key.hash(); }
   };
 
   Column& columnOf(const platform::Key& key);
+  static void append(Column& column, const platform::Value& value);
 
   std::vector<Column> columns_;
   std::unordered_map<platform::Key, std::size_t, KeyHash> positions_;
