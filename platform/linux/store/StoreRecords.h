@@ -6,6 +6,7 @@
 #include <string>
 #include <vector>
 
+#include "platform/linux/store/LinkParty.h"
 #include "platform/linux/store/SimpleRecords.h"
 #include "platform/value.h"
 
@@ -35,13 +36,6 @@ struct PowerEventRecord {
   Dictionary payload{};
 
   std::size_t bind(Statement& statement, int firstColumn, PayloadEncoder& encoder) const;
-};
-
-// The sender of link messages. All messages of one session share one object.
-struct LinkParty {
-  std::int64_t sessionID = 0;
-  std::string clientName;
-  std::string serviceName;
 };
 
 struct LinkMessageRecord {
