@@ -27,6 +27,7 @@ from gi.repository import Gio, GLib  # noqa: E402
 BIN = Path(os.environ.get("HALVOX_BIN", Path(__file__).parents[2] / "build/dev/bin")).resolve()
 SERVICE = BIN / "halvox-reportingd"
 CTL = BIN / "halvoxctl"
+STORE_EXTENSION = BIN / "halvox-sqlite.so"
 BUS_NAME = "com.tarno.halvox.reporting"
 OBJECT = "/com/tarno/halvox/reporting"
 UPTIME_EVENT = "com.tarno.halvox.hvreportingclientuptime"
@@ -141,6 +142,15 @@ class Startable:
                 shutil.rmtree(self.directory, ignore_errors=True)
 
 
+def connect_to_store(database, mode="ro"):
+    """Opens a store as any program does: with SQLite and the extension that unpacks messages."""
+    connection = sqlite3.connect(f"file:{database}?mode={mode}", uri=True)
+    connection.enable_load_extension(True)
+    connection.load_extension(str(STORE_EXTENSION))
+    connection.enable_load_extension(False)
+    return contextlib.closing(connection)
+
+
 class Service(Startable):
     """The built service with its own directories. Use as a context manager or call stop()."""
 
@@ -211,7 +221,7 @@ class Service(Startable):
         """The same, with the events that the service records when a client disconnects."""
         if not self.database.exists():
             return []
-        with contextlib.closing(sqlite3.connect(f"file:{self.database}?mode=ro", uri=True)) as database:
+        with connect_to_store(self.database) as database:
             rows = database.execute("SELECT name, payload FROM analytics_events").fetchall()
         return [(name, json.loads(payload)) for name, payload in rows]
 
@@ -219,9 +229,9 @@ class Service(Startable):
         """The messages of a session on the link, as (category, type, payload)."""
         if not self.database.exists():
             return []
-        with contextlib.closing(sqlite3.connect(f"file:{self.database}?mode=ro", uri=True)) as database:
+        with connect_to_store(self.database) as database:
             rows = database.execute("SELECT category, type, payload FROM link_messages"
-                                    " WHERE session_id = ? ORDER BY rowid", (session,)).fetchall()
+                                    " WHERE session_id = ?", (session,)).fetchall()
         return [(category, event_type, json.loads(payload)) for category, event_type, payload in rows]
 
     def wait_for_events(self, count):

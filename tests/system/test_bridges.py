@@ -2,10 +2,9 @@
 
 import contextlib
 import json
-import sqlite3
 import unittest
 
-from harness import Follower, Service, wait_for
+from harness import Follower, Service, connect_to_store, wait_for
 
 ISSUE_DETECTOR = 7
 JOULEBOOK = 8
@@ -26,8 +25,7 @@ class BridgesTest(unittest.TestCase):
     def stored(self, query):
         if not self.service.database.exists():
             return []
-        with contextlib.closing(
-                sqlite3.connect(f"file:{self.service.database}?mode=ro", uri=True)) as store:
+        with connect_to_store(self.service.database) as store:
             return store.execute(query).fetchall()
 
     def rows(self, query, count):

@@ -3,14 +3,13 @@
 import contextlib
 import json
 import re
-import sqlite3
 import subprocess
 import time
 import unittest
 from pathlib import Path
 
 import audio
-from harness import Service, require, stop_process, wait_for
+from harness import Service, connect_to_store, require, stop_process, wait_for
 
 SINK = "demo-speakers_Speaker_PipeWire_"
 GENERIC = 1
@@ -126,8 +125,7 @@ class DriverStatisticsTest(unittest.TestCase):
         query = "SELECT type, payload FROM link_messages WHERE category = 12"
 
         def sent():
-            with contextlib.closing(
-                    sqlite3.connect(f"file:{self.service.database}?mode=ro", uri=True)) as store:
+            with connect_to_store(self.service.database) as store:
                 return {kind: json.loads(payload) for kind, payload in store.execute(query)}
 
         messages = wait_for("three messages on the link", lambda: len(found := sent()) == 3 and found)

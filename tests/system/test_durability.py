@@ -15,7 +15,7 @@ import unittest
 from pathlib import Path
 
 import harness
-from harness import Client, Service, wait_for
+from harness import Client, Service, connect_to_store, wait_for
 
 
 # This number of messages is answered more than half a second before the kill.
@@ -50,7 +50,7 @@ class Durability(unittest.TestCase):
         sender.wait(harness.DEADLINE)
         reader.join(harness.DEADLINE)
 
-        with contextlib.closing(sqlite3.connect(service.database)) as database:
+        with connect_to_store(service.database, "rw") as database:
             self.assertEqual(database.execute("PRAGMA integrity_check").fetchall(), [("ok",)])
             rows = database.execute("SELECT name, payload FROM analytics_events").fetchall()
         numbers = [json.loads(payload)["number"] for name, payload in rows

@@ -1,13 +1,11 @@
 """A flood of messages that wait for their second affects only the client that sent it."""
 
-import contextlib
-import sqlite3
 import unittest
 
 from gi.repository import Gio
 
 import harness
-from harness import Service, wait_for
+from harness import Service, connect_to_store, wait_for
 
 MIB = 1024 * 1024
 FLOOD = 60
@@ -20,7 +18,7 @@ def stored(service):
     """The sender and number of each stored message, in the order of the store."""
     if not service.database.exists():
         return []
-    with contextlib.closing(sqlite3.connect(f"file:{service.database}?mode=ro", uri=True)) as database:
+    with connect_to_store(service.database) as database:
         return database.execute(
             "SELECT json_extract(payload, '$.from'), json_extract(payload, '$.number')"
             " FROM link_messages").fetchall()

@@ -1,14 +1,12 @@
 """Which sessions have the real-time link, and in which order it is opened, used and closed."""
 
-import contextlib
 import json
 import shutil
-import sqlite3
 import unittest
 
 import harness
 import nats
-from harness import Service, wait_for
+from harness import Service, connect_to_store, wait_for
 
 MUSIC = 7  # a service type that is not traced
 SINGLE = -1  # the session ID of messages outside of any session
@@ -22,7 +20,7 @@ FAILED = "failed to find backend"
 
 def stored(service):
     """Session, type and payload of each stored message of the link, in the order of the store."""
-    with contextlib.closing(sqlite3.connect(f"file:{service.database}?mode=ro", uri=True)) as database:
+    with connect_to_store(service.database) as database:
         rows = database.execute("SELECT session_id, type, payload FROM link_messages").fetchall()
     return [(session, kind, json.loads(payload)) for session, kind, payload in rows]
 

@@ -1,20 +1,18 @@
 """Settings take effect while the service runs: preferences from files, notifications by files."""
 
-import contextlib
 import ctypes
 import datetime
 import json
 import os
 import re
 import shutil
-import sqlite3
 import subprocess
 import tempfile
 import time
 import unittest
 from pathlib import Path
 
-from harness import CTL, Service, iterate_until, wait_for
+from harness import CTL, Service, connect_to_store, iterate_until, wait_for
 
 DOMAIN = "com.tarno.halvox"
 NOTIFICATION = "com.tarno.halvox.reporting"
@@ -91,8 +89,7 @@ class Settings(unittest.TestCase):
         """The state messages in the link's store: session (-1: a single message) and payload."""
         if not self.service.database.exists():
             return []
-        with contextlib.closing(
-                sqlite3.connect(f"file:{self.service.database}?mode=ro", uri=True)) as store:
+        with connect_to_store(self.service.database) as store:
             rows = store.execute("SELECT session_id, payload FROM link_messages"
                                  " WHERE category = ? AND type = ? ORDER BY session_id", SETUP)
             return [(session, json.loads(payload)) for session, payload in rows]

@@ -1,17 +1,15 @@
 """Leaked haptics sessions make an internal build capture diagnostics, and nothing else does."""
 
-import contextlib
 import json
 import re
 import signal
-import sqlite3
 import subprocess
 import time
 import unittest
 from pathlib import Path
 
 import harness
-from harness import CTL, Follower, Service, require, wait_for
+from harness import CTL, Follower, Service, connect_to_store, require, wait_for
 
 SESSION_GENERIC = 0x08000001
 JOULEBOOK = 8
@@ -158,7 +156,7 @@ class Snapshots(unittest.TestCase):
         for record in records:
             self.assertEqual(record["signature"]["DetectedProcess"], OWN_NAME)
         self.assertEqual(follower.leave(), 0)
-        with contextlib.closing(sqlite3.connect(f"file:{service.database}?mode=ro", uri=True)) as store:
+        with connect_to_store(service.database) as store:
             stored = store.execute("SELECT time, signature, path FROM snapshots ORDER BY time").fetchall()
         self.assertEqual([(json.loads(signature)["SubtypeContext"], path) for _, signature, path in stored],
                          [("Joulebook", record["path"]) for record in records])

@@ -9,15 +9,11 @@
 
 namespace halvox::platform::linux_ {
 
-// One event name. Any thread may read the constant members. The others are the name's row in the
-// database and belong to the store's writer; they are valid while `generation` equals that of
-// AnalyticsRecords.
+// One event name. Immutable; any thread may read it.
 struct EventName {
   EventName(std::string_view name, bool wanted) : text(name), isWanted(wanted) {}
   const std::string text;
   const bool isWanted;
-  std::int64_t databaseID = 0;
-  std::uint64_t generation = 0;
 };
 
 // A table of the event names seen so far. Each entry says whether events of that name are stored.

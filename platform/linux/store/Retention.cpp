@@ -16,6 +16,9 @@ constexpr std::chrono::minutes kAgeInterval{1};
 // writing.
 constexpr int kAgeSteps = 16;
 constexpr int kSizeSteps = 128;
+// How much is deleted ahead: this share of the database, at most this many bytes.
+constexpr std::uint64_t kShareAhead = 16;
+constexpr std::uint64_t kMostAhead = std::uint64_t{2} << 20U;
 constexpr std::uint64_t kLeastPage = 512;  // SQLite's smallest page
 
 SqliteCode readInteger(Statement& statement, std::uint64_t& value) {
@@ -106,11 +109,11 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
   return hasShrunk && !more ? statements_.checkpoint.run() : SQLITE_OK;
 }
 
-bool Retention::isFull() const {
+bool Retention::isFull(std::uint64_t more) const {
   // Reserve the payload of one transaction, and a quarter more for what pages hold in addition to
   // payloads. The next transaction then fills free pages, and the file does not grow.
   const std::uint64_t reserve = limits_.transactionBytes + limits_.transactionBytes / 4;
-  return (pages_ - freePages_) * pageBytes_ + reserve > limits_.databaseBytes;
+  return (pages_ - freePages_) * pageBytes_ + reserve + more > limits_.databaseBytes;
 }
 
 SqliteCode Retention::readUse() {
@@ -138,10 +141,15 @@ SqliteCode Retention::deleteAged(double now, std::span<RecordKind* const> kinds,
 }
 
 SqliteCode Retention::deleteForSize(std::span<RecordKind* const> kinds, bool& more) {
+  // Delete for several transactions at once. A deletion writes pages of tables and of the list of
+  // free pages; deletions of neighbouring blocks write the same ones.
+  const std::uint64_t ahead = std::min(limits_.databaseBytes / kShareAhead, kMostAhead);
+  SqliteCode code = readUse();
+  if (code != SQLITE_OK || !isFull()) return code;
   for (int step = 0; step < kSizeSteps; ++step) {
-    SqliteCode code = readUse();
+    code = readUse();
     // Measure again after each step: the records that it deletes may be large or small.
-    if (code != SQLITE_OK || !isFull()) return code;
+    if (code != SQLITE_OK || !isFull(ahead)) return code;
     bool found = false;
     code = deleteOldest(kinds, found);
     if (code != SQLITE_OK || !found) return code;

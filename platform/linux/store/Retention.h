@@ -36,8 +36,8 @@ class Retention {
   using Time = std::chrono::steady_clock::time_point;
 
   [[nodiscard]] SqliteCode readUse();
-  // Returns true when another transaction could make the file outgrow its limit.
-  [[nodiscard]] bool isFull() const;
+  // Returns true when another transaction and `more` bytes could make the file outgrow its limit.
+  [[nodiscard]] bool isFull(std::uint64_t more = 0) const;
   [[nodiscard]] std::uint64_t fileBytes() const { return pages_ * pageBytes_; }
   [[nodiscard]] SqliteCode deleteAged(double now, std::span<RecordKind* const> kinds, bool& more);
   [[nodiscard]] SqliteCode deleteForSize(std::span<RecordKind* const> kinds, bool& more);

@@ -21,10 +21,9 @@ class RetentionTest : public StoreFixture {
   }
   // Sends events of about 500 bytes.
   void sendLong(std::int64_t count) {
-    const std::string filler(480, 'x');
     for (std::int64_t number = 0; number < count; ++number) {
-      service->sendAnalyticsEventLazy("long", [number, filler] {
-        return Dictionary{{"n", number}, {"f", filler}};
+      service->sendAnalyticsEventLazy("long", [number] {
+        return Dictionary{{"n", number}, {"f", noise(static_cast<std::uint64_t>(number), 480)}};
       });
     }
   }
@@ -82,7 +81,7 @@ TEST_F(RetentionTest, NumbersGrowAfterEverythingWasDeleted) {
   start();
   send(1);
   stop();
-  EXPECT_THAT(rows(database(), "SELECT id > 4000 FROM analytics_records"), ElementsAre("1"));
+  EXPECT_THAT(rows(database(), "SELECT id FROM message_blocks"), ElementsAre("5001"));
 }
 
 TEST_F(RetentionTest, StaysWithinOneMegabyteAndKeepsTheNewest) {
@@ -116,9 +115,9 @@ TEST_F(RetentionTest, StaysWithinItsSizeUnderAFlood) {
 }
 
 TEST_F(RetentionTest, ShrinksTheFileWhenTheLimitWasLowered) {
-  options.maxMegabytes = 16;
+  options.maxMegabytes = 32;
   start();
-  sendLong(20'000);
+  sendLong(26'000);
   stop();
   ASSERT_GT(bytesOnDisk(), 8U * 1024U * 1024U);
 
@@ -127,7 +126,7 @@ TEST_F(RetentionTest, ShrinksTheFileWhenTheLimitWasLowered) {
   ASSERT_TRUE(eventually([this] { return bytesOnDisk() <= 1024U * 1024U; }));
   stop();
   EXPECT_LE(bytesOnDisk(), 1024U * 1024U);
-  EXPECT_TRUE(payloads().back().starts_with("{\"n\":19999,"));
+  EXPECT_TRUE(payloads().back().starts_with("{\"n\":25999,"));
 }
 
 }  // namespace

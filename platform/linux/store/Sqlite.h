@@ -88,6 +88,11 @@ class Database {
   [[nodiscard]] std::string errorText() const;
   // The errno of the system call that caused the last error; 0 if none did.
   [[nodiscard]] int systemError() const { return sqlite3_system_errno(handle_.get()); }
+  // Whether the last call failed: errorText() says "not an error" otherwise.
+  [[nodiscard]] bool hasError() const {
+    const int code = sqlite3_errcode(handle_.get()) & 0xFF;
+    return code != SQLITE_OK && code != SQLITE_ROW && code != SQLITE_DONE;
+  }
   [[nodiscard]] sqlite3* get() const { return handle_.get(); }
 
  private:

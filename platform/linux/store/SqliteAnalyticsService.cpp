@@ -11,7 +11,7 @@ bool SqliteAnalyticsService::isAnalyticsEventUsed(std::string_view eventName) {
 
 void SqliteAnalyticsService::sendAnalyticsEventLazy(std::string eventName,
                                                     AnalyticsPayloadBuilder builder) {
-  records_.add(clock_.currentDate().secondsSince1970, eventName, std::move(builder));
+  records_.addEvent(clock_.currentDate().secondsSince1970, eventName, std::move(builder));
 }
 
 }  // namespace halvox::platform::linux_

@@ -12,7 +12,7 @@ namespace halvox::platform::linux_ {
 class SqliteAnalyticsService final : public AnalyticsService {
  public:
   SqliteAnalyticsService(SqliteStore& store, const ClockService& clock)
-      : names_(store.eventNames()), records_(store.analyticsRecords()), clock_(clock) {}
+      : names_(store.eventNames()), records_(store.messages()), clock_(clock) {}
 
   [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override;
   // Stamps the event with the time of the call. The builder runs later, on the writer's thread.
@@ -20,7 +20,7 @@ class SqliteAnalyticsService final : public AnalyticsService {
 
  private:
   EventNames& names_;
-  AnalyticsRecords& records_;
+  MessageRecords& records_;
   const ClockService& clock_;
 };
 

@@ -48,10 +48,10 @@ SqliteStore::SqliteStore(const StoreOptions& options, const Environment& environ
       files_(options.directory),
       queue_(options.queue, environment.backpressure),
       eventNames_(options.wantedEvents),
-      analyticsRecords_(eventNames_, queue_, environment.statistics, sizes_.payloadBytes),
+      messages_(eventNames_, queue_, environment.statistics, sizes_.payloadBytes),
+      linkMessages_(messages_),
       issueMetrics_(queue_, environment.statistics, sizes_.payloadBytes),
       powerEvents_(queue_, environment.statistics, sizes_.payloadBytes),
-      linkMessages_(queue_, environment.statistics, sizes_.payloadBytes),
       snapshots_(queue_, environment.statistics, sizes_.payloadBytes),
       retention_({.age = std::chrono::days(options.retentionDays),
                   .databaseBytes = sizes_.databaseBytes,
@@ -243,7 +243,8 @@ void SqliteStore::fail(SqliteCode code, std::string_view what) {
   const int systemError = database_.systemError() != 0 ? database_.systemError() : lastError;
   const DropReason reason = reasonOf(code, systemError);
   const std::string description =
-      files_.database().native() + ": " + std::string(what) + ": " + database_.errorText();
+      files_.database().native() + ": " + std::string(what) + ": " +
+      (database_.hasError() ? database_.errorText() : "a block of messages is damaged");
   if (sqlite3_get_autocommit(database_.get()) == 0) {
     static_cast<void>(database_.execute("ROLLBACK"));
   }

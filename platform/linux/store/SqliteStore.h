@@ -12,8 +12,9 @@
 #include "platform/clock.h"
 #include "platform/linux/configuration/Defaults.h"
 #include "platform/linux/dispatch/Backpressure.h"
-#include "platform/linux/store/AnalyticsRecords.h"
 #include "platform/linux/store/EventNames.h"
+#include "platform/linux/store/MessageRecords.h"
+#include "platform/linux/store/OldRecords.h"
 #include "platform/linux/store/Retention.h"
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreCheck.h"
@@ -75,7 +76,7 @@ class SqliteStore {
   void close();
 
   [[nodiscard]] EventNames& eventNames() { return eventNames_; }
-  [[nodiscard]] AnalyticsRecords& analyticsRecords() { return analyticsRecords_; }
+  [[nodiscard]] MessageRecords& messages() { return messages_; }
   [[nodiscard]] IssueMetricRecords& issueMetrics() { return issueMetrics_; }
   [[nodiscard]] PowerEventRecords& powerEvents() { return powerEvents_; }
   [[nodiscard]] LinkMessageRecords& linkMessages() { return linkMessages_; }
@@ -113,13 +114,15 @@ class SqliteStore {
   StoreFiles files_;
   WriterQueue queue_;
   EventNames eventNames_;
-  AnalyticsRecords analyticsRecords_;
+  MessageRecords messages_;
+  LinkMessageRecords linkMessages_;
   IssueMetricRecords issueMetrics_;
   PowerEventRecords powerEvents_;
-  LinkMessageRecords linkMessages_;
   SnapshotRecords snapshots_;
-  const std::array<RecordKind*, 5> kinds_{&analyticsRecords_, &issueMetrics_, &powerEvents_,
-                                          &linkMessages_, &snapshots_};
+  OldRecords oldEvents_{"analytics_records", "analytics_spans"};
+  OldRecords oldLinkMessages_{kLinkMessages.records, kLinkMessages.spans};
+  const std::array<RecordKind*, 6> kinds_{&messages_,  &issueMetrics_, &powerEvents_,
+                                          &snapshots_, &oldEvents_,    &oldLinkMessages_};
 
   // After open() only the writer's thread uses these.
   Database database_;

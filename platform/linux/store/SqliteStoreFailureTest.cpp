@@ -34,7 +34,7 @@ class SqliteStoreFailureTest : public StoreFixture {
   // Adds one record of every kind except events.
   void addOneOfEachKind() {
     const double now = platform.clock.currentDate().secondsSince1970;
-    const Dictionary payload{{"f", std::string(1000, 'x')}};
+    const Dictionary payload{{"f", noise(counted("received"), 1000)}};
     store->issueMetrics().add(
         {.time = now, .metricID = 1, .message = std::vector<std::byte>(1000)});
     store->powerEvents().add({.time = now, .eventName = "e", .payload = payload});
@@ -47,7 +47,7 @@ class SqliteStoreFailureTest : public StoreFixture {
     send(1);
     ASSERT_TRUE(allIsStored());
     ASSERT_EQ(reader.open(database(), DatabaseAccess::kReadOnly), SQLITE_OK);
-    ASSERT_EQ(reader.execute("BEGIN; SELECT count(*) FROM analytics_events"), SQLITE_OK);
+    ASSERT_EQ(reader.execute("BEGIN; SELECT count(*) FROM message_blocks"), SQLITE_OK);
   }
   void expectBalance() {
     EXPECT_EQ(counted("received"), counted("stored") + dropped());
@@ -81,6 +81,7 @@ TEST_F(SqliteStoreFailureTest, RecordsOfEveryKindAreCountedWhileTheDiskIsFullAnd
     return platform.statistics.value(piece, name);
   };
   const RecordTable* tables[] = {&kIssueMetrics, &kPowerEvents, &kLinkMessages, &kSnapshots};
+  const std::string_view views[] = {"issue_metrics", "power_events", "link_messages", "snapshots"};
   {
     const FileSizeLimit limit(200'000);
     for (int number = 0; number < 2000; ++number) addOneOfEachKind();
@@ -100,7 +101,7 @@ TEST_F(SqliteStoreFailureTest, RecordsOfEveryKindAreCountedWhileTheDiskIsFullAnd
     EXPECT_EQ(count(piece, "stored"), before[kind] + 1) << piece;
     EXPECT_EQ(count(piece, "received"), count(piece, "stored") + count(piece, "dropped: disk full"))
         << piece;
-    EXPECT_THAT(rows(database(), "SELECT count(*) FROM " + std::string(tables[kind]->records)),
+    EXPECT_THAT(rows(database(), "SELECT count(*) FROM " + std::string(views[kind])),
                 ElementsAre(std::to_string(count(piece, "stored"))))
         << piece;
   }
@@ -211,9 +212,11 @@ TEST_F(SqliteStoreFailureTest, ContinuesWithADatabaseThatReplacedItsOwn) {
 TEST_F(SqliteStoreFailureTest, SetsAsideAFileThatIsDestroyedWhileItRunsAndContinues) {
   options.maxMegabytes = 4;
   start();
-  const std::string filler(500, 'x');
+  std::uint64_t sent = 0;
   const auto sendLong = [&] {
-    service->sendAnalyticsEventLazy("a", [filler] { return Dictionary{{"k", filler}}; });
+    service->sendAnalyticsEventLazy("a", [number = ++sent] {
+      return Dictionary{{"k", noise(number, 500)}};
+    });
   };
   for (int number = 0; number < 10'000; ++number) sendLong();
   ASSERT_TRUE(allIsStored());

@@ -1,7 +1,5 @@
 #include "platform/linux/store/StoreExtent.h"
 
-#include "platform/linux/store/StoreSchema.h"
-
 namespace halvox::platform::linux_ {
 namespace {
 
@@ -40,7 +38,7 @@ SqliteCode copyKind(const KindTables& tables, std::int64_t newest, Database& dat
       // time than its records: readers use it only to skip records.
       "INSERT INTO main." +
       spans + " SELECT * FROM damaged." + spans +
-      " WHERE span >= " + std::to_string((newest + 1) / kRecordsPerSpan) +
+      " WHERE span >= " + std::to_string((newest + 1) / tables.recordsPerSpan) +
       ";"
       "COMMIT");
   if (code != SQLITE_OK) static_cast<void>(database.execute("ROLLBACK"));
@@ -53,7 +51,9 @@ SqliteCode StoreExtent::read(Database& database, StoreExtent& extent) {
   for (std::size_t kind = 0; kind < kKindTables.size(); ++kind) {
     Statement statement;
     SqliteCode code = database.prepare(
-        "SELECT ifnull(max(id), 0) FROM " + std::string(kKindTables[kind].records), statement);
+        "SELECT ifnull((SELECT " + std::string(kKindTables[kind].newest) + " FROM " +
+            std::string(kKindTables[kind].records) + " ORDER BY id DESC LIMIT 1), 0)",
+        statement);
     if (code == SQLITE_OK) code = statement.step();
     if (code != SQLITE_ROW) return code;
     extent.newest[kind] = statement.integer(0);
@@ -86,8 +86,8 @@ std::uint64_t copyRecordsAfter(const StoreExtent& extent, const std::string& fil
       continue;
     }
     // All records in the new database are copies, because it was empty.
-    const auto count =
-        database.queryInteger("SELECT count(*) FROM main." + std::string(tables.records));
+    const auto count = database.queryInteger("SELECT " + std::string(tables.count) + " FROM main." +
+                                             std::string(tables.records));
     copied += static_cast<std::uint64_t>(count.value_or(0));
   }
   return copied;

@@ -7,6 +7,7 @@
 #include <string_view>
 
 #include "platform/linux/store/Sqlite.h"
+#include "platform/linux/store/StoreSchema.h"
 
 namespace halvox::platform::linux_ {
 
@@ -14,14 +15,19 @@ namespace halvox::platform::linux_ {
 struct KindTables {
   std::string_view records;
   std::string_view spans;
+  std::int64_t recordsPerSpan = kRecordsPerSpan;
+  std::string_view newest = "id";       // the number of the newest record, in terms of its row
+  std::string_view count = "count(*)";  // the number of records, over all rows
 };
 
-inline constexpr std::array<KindTables, 5> kKindTables{{
+// Those of analytics and link messages belong to the versions before blocks.
+inline constexpr std::array<KindTables, 6> kKindTables{{
     {"analytics_records", "analytics_spans"},
     {"issue_metric_records", "issue_metric_spans"},
     {"power_event_records", "power_event_spans"},
     {"link_message_records", "link_message_spans"},
     {"snapshot_records", "snapshot_spans"},
+    {"message_blocks", "message_spans", 1, "id + records - 1", "ifnull(sum(records), 0)"},
 }};
 
 // The number of the newest record of each kind, in the order of kKindTables; 0 if there is none. A

@@ -4,6 +4,9 @@
 #include <fstream>
 #include <iterator>
 #include <ostream>
+#include <random>
+
+#include "platform/linux/store/blocks/MessageTables.h"
 
 namespace halvox::platform::linux_ {
 
@@ -12,6 +15,7 @@ std::vector<std::string> rows(const std::filesystem::path& database, std::string
   Statement statement;
   std::vector<std::string> result;
   if (connection.open(database, DatabaseAccess::kReadOnly) != SQLITE_OK ||
+      addMessageTables(connection.get()) != SQLITE_OK ||
       connection.prepare(sql, statement) != SQLITE_OK) {
     return {"error: " + connection.errorText()};
   }
@@ -83,5 +87,14 @@ std::uint64_t StoreFixture::dropped() const {
 }
 
 std::string numbered(std::int64_t number) { return "{\"number\":" + std::to_string(number) + "}"; }
+
+std::string noise(std::uint64_t number, std::size_t length) {
+  constexpr std::string_view kAlphabet =
+      "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789-_";
+  std::mt19937_64 random(number);
+  std::string text;
+  while (text.size() < length) text += kAlphabet[random() % kAlphabet.size()];
+  return text;
+}
 
 }  // namespace halvox::platform::linux_

@@ -67,5 +67,7 @@ class StoreFixture : public ::testing::Test {
 
 // The payload of send(number).
 [[nodiscard]] std::string numbered(std::int64_t number);
+// A text of that length which compresses by no more than a quarter. Each number gives another.
+[[nodiscard]] std::string noise(std::uint64_t number, std::size_t length);
 
 }  // namespace halvox::platform::linux_

@@ -29,17 +29,6 @@ std::size_t PowerEventRecord::bind(Statement& statement, int firstColumn,
          eventName.size();
 }
 
-std::size_t LinkMessageRecord::bind(Statement& statement, int firstColumn,
-                                    PayloadEncoder& encoder) const {
-  statement.bind(firstColumn + kLinkSessionID, party->sessionID);
-  statement.bind(firstColumn + kLinkClientName, std::string_view(party->clientName));
-  statement.bind(firstColumn + kLinkServiceName, std::string_view(party->serviceName));
-  statement.bind(firstColumn + kLinkCategory, std::int64_t{category});
-  statement.bind(firstColumn + kLinkType, std::int64_t{type});
-  return bindPayload(statement, firstColumn + kLinkPayload, payload, encoder).size() +
-         party->clientName.size() + party->serviceName.size();
-}
-
 std::size_t SnapshotRecord::bind(Statement& statement, int firstColumn,
                                  PayloadEncoder& encoder) const {
   statement.bind(firstColumn + kSnapshotPath, std::string_view(path));

@@ -6,7 +6,6 @@
 #include <string>
 #include <vector>
 
-#include "platform/linux/store/LinkParty.h"
 #include "platform/linux/store/SimpleRecords.h"
 #include "platform/value.h"
 
@@ -38,17 +37,6 @@ struct PowerEventRecord {
   std::size_t bind(Statement& statement, int firstColumn, PayloadEncoder& encoder) const;
 };
 
-struct LinkMessageRecord {
-  static constexpr const RecordTable& table = kLinkMessages;
-  double time = 0;
-  std::shared_ptr<const LinkParty> party;  // held by the session and by its waiting messages
-  std::uint16_t category = 0;
-  std::uint16_t type = 0;
-  Dictionary payload{};
-
-  std::size_t bind(Statement& statement, int firstColumn, PayloadEncoder& encoder) const;
-};
-
 struct SnapshotRecord {
   static constexpr const RecordTable& table = kSnapshots;
   double time = 0;
@@ -60,7 +48,6 @@ struct SnapshotRecord {
 
 using IssueMetricRecords = SimpleRecords<IssueMetricRecord>;
 using PowerEventRecords = SimpleRecords<PowerEventRecord>;
-using LinkMessageRecords = SimpleRecords<LinkMessageRecord>;
 using SnapshotRecords = SimpleRecords<SnapshotRecord>;
 
 }  // namespace halvox::platform::linux_

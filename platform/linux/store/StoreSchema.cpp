@@ -100,9 +100,59 @@ CREATE VIEW snapshots(time, signature, path) AS
 SELECT time, signature, path FROM snapshot_records;
 )sql";
 
+// Events and link messages of earlier versions stay where they are until they are too old: moving
+// them would take minutes. New ones go into blocks, and the views show both. The tables
+// halvox_events and halvox_links unpack blocks. The programs of this system have these tables;
+// others load halvox-sqlite.so.
+//
+// message_blocks.id is the number of the block's first record. Numbers continue after those of the
+// old tables, in which the events of record n have the numbers 2n and 2n + 1 and a link message has
+// that of its record. The row without records keeps the first number.
+//
+// A row of message_spans exists for each sealed block and has its number. Its keys say which
+// sessions, applications and names the block has (blocks/BlockKeys.h).
+constexpr std::string_view kMessageBlocks = R"sql(
+CREATE TABLE message_blocks(
+  id INTEGER PRIMARY KEY,
+  records INTEGER NOT NULL,
+  first_time REAL NOT NULL,
+  last_time REAL NOT NULL,
+  block BLOB NOT NULL);
+CREATE TABLE message_spans(
+  span INTEGER PRIMARY KEY,
+  first_time REAL NOT NULL,
+  last_time REAL NOT NULL,
+  keys BLOB NOT NULL);
+INSERT INTO message_blocks
+SELECT next, 0, 0, 0, x''
+FROM (SELECT 1 + max(
+        2 * max(ifnull((SELECT max(id) FROM analytics_records), 0),
+                ifnull((SELECT 512 * (max(span) + 1) FROM analytics_spans), 0)) + 1,
+        ifnull((SELECT max(id) FROM link_message_records), 0),
+        ifnull((SELECT 512 * (max(span) + 1) FROM link_message_spans), 0)) AS next)
+WHERE next > 2;
+DROP VIEW analytics_events;
+CREATE VIEW analytics_events(time, name, payload) AS
+SELECT CASE which.twin WHEN 0 THEN record.time ELSE record.twin_time END,
+       event_names.name,
+       record.payload
+FROM analytics_records AS record
+CROSS JOIN (SELECT 0 AS twin UNION ALL SELECT 1) AS which
+CROSS JOIN event_names
+  ON event_names.id = CASE which.twin WHEN 0 THEN record.name_id ELSE record.twin_name_id END
+UNION ALL
+SELECT time, name, payload FROM halvox_events;
+DROP VIEW link_messages;
+CREATE VIEW link_messages(time, session_id, client_name, service_name, category, type, payload) AS
+SELECT time, session_id, client_name, service_name, category, type, payload
+FROM link_message_records
+UNION ALL
+SELECT time, session_id, client_name, service_name, category, type, payload FROM halvox_links;
+)sql";
+
 // Step n migrates from version n to version n + 1. Never change a step that was released: stores
 // that have already applied it would differ from new ones.
-constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords};
+constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords, kMessageBlocks};
 
 }  // namespace
 

@@ -16,6 +16,9 @@ constexpr std::int64_t kRecordsPerSpan = 512;
 // The schema version that this program writes, stored in `PRAGMA user_version`.
 extern const std::int64_t kStoreSchemaVersion;
 
+// The first schema version with message_blocks.
+constexpr std::int64_t kBlocksSinceVersion = 3;
+
 // Migrates an empty or older database to the current version, one transaction a step. On an error
 // it rolls the failed step back, keeps the steps before it and returns the code; the next call
 // continues there. The database must not be newer than kStoreSchemaVersion.

@@ -136,8 +136,8 @@ TEST_F(LocalTlmReportingServiceTest, EachSessionOfManyThreadsKeepsItsOrder) {
 
   EXPECT_THAT(rows(database(),
                    "SELECT count(*) FROM (SELECT json_extract(payload, '$.n') AS n,"
-                   " row_number() OVER (PARTITION BY session_id ORDER BY id) - 1 AS place"
-                   " FROM link_message_records) WHERE n = place"),
+                   " row_number() OVER (PARTITION BY session_id ORDER BY rowid) - 1 AS place"
+                   " FROM halvox_links) WHERE n = place"),
               ElementsAre("8000"));
 }
 

@@ -7,7 +7,7 @@
 #include <string>
 
 #include "platform/linux/link/local/CallbackThread.h"
-#include "platform/linux/store/StoreRecords.h"
+#include "platform/linux/store/LinkParty.h"
 #include "platform/tlm_reporting.h"
 
 namespace halvox::platform::linux_ {

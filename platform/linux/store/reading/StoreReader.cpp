@@ -1,5 +1,6 @@
 #include "platform/linux/store/reading/StoreReader.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cstdio>
@@ -9,6 +10,7 @@
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/store/StoreOpening.h"
 #include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/reading/BlockScan.h"
 #include "platform/linux/store/reading/EventScan.h"
 #include "platform/linux/store/reading/RecordScan.h"
 
@@ -97,9 +99,48 @@ SqliteCode StoreReader::openFile() {
   return needsLog && files_->logBytes() == 0 ? attempt(immutableURI(path)) : code;
 }
 
+template <typename ReadOld, typename Deliver>
+Result<void, StoreError> StoreReader::forEachMessage(BlockRecordKind kind,
+                                                     const RecordFilter& filter, ReadOld old,
+                                                     Deliver deliver) {
+  // Read the version for each call: a service may have migrated the store since it was opened.
+  const auto version = database_.queryInteger("PRAGMA user_version");
+  if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
+  lastRead_ = 0;
+  if (*version < kBlocksSinceVersion) return outcome(old(filter, *version));
+  BlockScan blocks(database_, kind, filter);
+  SqliteCode code = blocks.begin();
+  if (blocks.isDamaged()) return damagedBlock(blocks.id());
+  if (code == SQLITE_OK && (!filter.newest.has_value() || blocks.missing() > 0)) {
+    RecordFilter before = filter;
+    if (filter.newest.has_value()) before.newest = blocks.missing();
+    code = old(before, *version);
+  }
+  for (bool found = false; code == SQLITE_OK;) {
+    code = blocks.nextBlock(found);
+    if (!found) break;
+    while (blocks.nextRecord()) deliver(blocks.id(), blocks.record());
+    if (blocks.isDamaged()) return damagedBlock(blocks.id());
+  }
+  if (code != SQLITE_OK) return failure(code);
+  lastRead_ = std::max(lastRead_, blocks.last());
+  return {};
+}
+
 Result<void, StoreError> StoreReader::forEachEvent(const RecordFilter& filter,
                                                    const EventCallback& callback) {
   if (!database_.isOpen()) return Failure<StoreError>{StoreError::kMissing, "no store is open"};
+  return forEachMessage(
+      BlockRecordKind::kEvent, filter,
+      [&](const RecordFilter& before, std::int64_t /*version*/) {
+        return readOldEvents(before, callback);
+      },
+      [&](StoredRecordID id, const BlockRecord& record) {
+        callback({id, record.time, record.name, record.payload});
+      });
+}
+
+SqliteCode StoreReader::readOldEvents(const RecordFilter& filter, const EventCallback& callback) {
   EventScan scan(database_, filter);
   SqliteCode code = scan.begin();
   EventScan::Piece piece;
@@ -109,21 +150,33 @@ Result<void, StoreError> StoreReader::forEachEvent(const RecordFilter& filter,
       callback({event.id, event.time, scan.nameOf(event.nameID), piece.payloads[event.payload]});
     }
   }
-  if (code != SQLITE_OK) return failure(code);
-  lastRead_ = scan.last();
-  return {};
+  // An empty table's last event would be the twin of record 0, which has the number of a message.
+  if (code == SQLITE_OK && scan.last() > 1) lastRead_ = scan.last();
+  return code;
 }
 
 Result<void, StoreError> StoreReader::forEachRecord(const RecordTable& table,
                                                     const RecordFilter& filter,
                                                     const RecordCallback& callback) {
   if (!database_.isOpen()) return Failure<StoreError>{StoreError::kMissing, "no store is open"};
+  // A store from an older service lacks the table and has no such records.
+  const auto rows = [&](const RecordFilter& before, std::int64_t version) {
+    return version < table.sinceVersion ? SQLITE_OK : readRows(table, before, callback);
+  };
+  if (&table == &kLinkMessages) {
+    return forEachMessage(
+        BlockRecordKind::kLink, filter, rows,
+        [&](StoredRecordID id, const BlockRecord& record) { callback(linkRecord(id, record)); });
+  }
   // Read the version for each call: a service may have migrated the store since it was opened.
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   lastRead_ = 0;
-  // A store from an older service lacks the table and has no such records.
-  if (*version < table.sinceVersion) return {};
+  return outcome(rows(filter, *version));
+}
+
+SqliteCode StoreReader::readRows(const RecordTable& table, const RecordFilter& filter,
+                                 const RecordCallback& callback) {
   RecordScan scan(database_, table, filter);
   SqliteCode code = scan.begin();
   std::vector<StoredRecord> piece;
@@ -131,9 +184,19 @@ Result<void, StoreError> StoreReader::forEachRecord(const RecordTable& table,
     code = scan.next(piece);
     for (const StoredRecord& record : piece) callback(record);
   }
+  if (code == SQLITE_OK) lastRead_ = scan.last();
+  return code;
+}
+
+Result<void, StoreError> StoreReader::outcome(SqliteCode code) const {
   if (code != SQLITE_OK) return failure(code);
-  lastRead_ = scan.last();
   return {};
+}
+
+Failure<StoreError> StoreReader::damagedBlock(StoredRecordID after) const {
+  return {StoreError::kDamaged, files_->database().native() +
+                                    ": the database is damaged: the block of message " +
+                                    std::to_string(after) + " cannot be unpacked"};
 }
 
 bool StoreReader::isReplaced() const {

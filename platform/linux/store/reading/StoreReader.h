@@ -14,6 +14,7 @@
 #include "platform/linux/store/Sqlite.h"
 #include "platform/linux/store/StoreError.h"
 #include "platform/linux/store/StoreFiles.h"
+#include "platform/linux/store/blocks/MessageBlock.h"
 
 namespace halvox::platform::linux_ {
 
@@ -98,7 +99,17 @@ class StoreReader {
 
  private:
   [[nodiscard]] Failure<StoreError> failure(SqliteCode code) const;
+  [[nodiscard]] Failure<StoreError> damagedBlock(StoredRecordID after) const;
+  [[nodiscard]] Result<void, StoreError> outcome(SqliteCode code) const;
   Result<void, StoreError> openDatabase();
+  // Calls `deliver` for each record in blocks. First calls `old`, which reads the records that are
+  // not in blocks and sets lastRead_.
+  template <typename ReadOld, typename Deliver>
+  Result<void, StoreError> forEachMessage(BlockRecordKind kind, const RecordFilter& filter,
+                                          ReadOld old, Deliver deliver);
+  [[nodiscard]] SqliteCode readOldEvents(const RecordFilter& filter, const EventCallback& callback);
+  [[nodiscard]] SqliteCode readRows(const RecordTable& table, const RecordFilter& filter,
+                                    const RecordCallback& callback);
   [[nodiscard]] SqliteCode openFile();
 
   std::optional<StoreFiles> files_;

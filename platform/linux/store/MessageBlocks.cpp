@@ -1,0 +1,296 @@
+#include "platform/linux/store/MessageBlocks.h"
+
+#include <algorithm>
+#include <string>
+#include <utility>
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// Enough records for a block: those of 85 messages with two events and a link message each. Blocks
+// of 32 messages take twice the bytes of blocks of 340.
+constexpr std::uint64_t kRecordsToSeal = 256;
+// An open row with fewer records fits into the page that its commit writes anyway.
+constexpr std::uint64_t kRecordsToCompress = 24;
+// Larger blocks save few bytes. A reader that wants one record unpacks a whole block, which takes
+// 1 ms at this size.
+constexpr std::uint64_t kMostRecords = 1024;
+constexpr std::uint64_t kMostBytes = std::uint64_t{256} * 1024;
+
+constexpr const char* kNoSpan = "(SELECT ifnull(max(span), -1) FROM message_spans)";
+
+}  // namespace
+
+SqliteCode MessageBlocks::prepare(Database& database) {
+  isStateKnown_ = false;
+  const std::string openRows = std::string(" FROM message_blocks WHERE id > ") + kNoSpan;
+  for (const auto& [statement, sql] :
+       {std::pair<Statement*, std::string>{
+            &statements_.insertBlock,
+            // The row may replace one without records, which keeps the next number.
+            "INSERT OR REPLACE INTO message_blocks VALUES (?1, ?2, ?3, ?4, ?5)"},
+        {&statements_.insertSpan, "INSERT OR REPLACE INTO message_spans VALUES (?1, ?2, ?3, ?4)"},
+        {&statements_.newest, "SELECT id, records FROM message_blocks ORDER BY id DESC LIMIT 1"},
+        {&statements_.openRows,
+         "SELECT id, records, block" + openRows + " AND records > 0 ORDER BY id"},
+        {&statements_.deleteOpenRows, "DELETE FROM message_blocks WHERE id >= ?1"},
+        {&statements_.oldest,
+         "SELECT id, records, first_time FROM message_blocks WHERE records > 0"
+         " ORDER BY id LIMIT 1"},
+        {&statements_.agedSpan,
+         "SELECT span FROM message_spans WHERE first_time < ?1 ORDER BY span LIMIT 1"},
+        {&statements_.agedOpenRow,
+         "SELECT id" + openRows + " AND records > 0 AND first_time < ?1 ORDER BY id LIMIT 1"},
+        {&statements_.block, "SELECT records, last_time, block FROM message_blocks WHERE id = ?1"},
+        {&statements_.deleteBlock, "DELETE FROM message_blocks WHERE id = ?1"},
+        {&statements_.deleteSpan, "DELETE FROM message_spans WHERE span = ?1"}}) {
+    const SqliteCode code = database.prepare(sql, *statement);
+    if (code != SQLITE_OK) return code;
+  }
+  return SQLITE_OK;
+}
+
+void MessageBlocks::release() {
+  statements_ = {};
+  isStateKnown_ = false;
+}
+
+SqliteCode MessageBlocks::readState() {
+  if (isStateKnown_) return SQLITE_OK;
+  next_ = firstOpen_ = 1;
+  openBytes_ = 0;
+  SqliteCode code = statements_.newest.step();
+  if (code == SQLITE_ROW) {
+    next_ = firstOpen_ = statements_.newest.integer(0) + statements_.newest.integer(1);
+  }
+  statements_.newest.reset();
+  if (code != SQLITE_ROW && code != SQLITE_DONE) return code;
+  bool isFirst = true;
+  while ((code = statements_.openRows.step()) == SQLITE_ROW) {
+    if (std::exchange(isFirst, false)) firstOpen_ = statements_.openRows.integer(0);
+    openBytes_ += statements_.openRows.bytes(2).size();
+  }
+  statements_.openRows.reset();
+  if (code != SQLITE_DONE) return code;
+  isStateKnown_ = true;
+  clearGathered();
+  // Open rows of an earlier run get a block of their own. If a block had records of both runs, a
+  // store that replaces a damaged database could not copy only those of this run.
+  return firstOpen_ < next_ ? sealOpenRows() : SQLITE_OK;
+}
+
+SqliteCode MessageBlocks::begin(std::uint64_t records) {
+  SqliteCode code = readState();
+  if (code != SQLITE_OK) return code;
+  clearGathered();
+  const auto open = static_cast<std::uint64_t>(next_ - firstOpen_);
+  const bool isEnough = open + records >= kRecordsToSeal || openBytes_ >= kMostBytes;
+  return open > 0 && isEnough ? gatherOpenRows() : SQLITE_OK;
+}
+
+// Moves the open rows into writer_ and deletes them. The sealed block will have the number of the
+// first one.
+SqliteCode MessageBlocks::gatherOpenRows() {
+  gathered_.first = firstOpen_;
+  SqliteCode code = SQLITE_ROW;
+  while ((code = statements_.openRows.step()) == SQLITE_ROW) {
+    const SqliteCode added =
+        gatherBlock(statements_.openRows.bytes(2), statements_.openRows.integer(1), std::nullopt);
+    if (added != SQLITE_OK) {
+      code = added;
+      break;
+    }
+  }
+  statements_.openRows.reset();
+  if (code != SQLITE_DONE) return code;
+  statements_.deleteOpenRows.bind(1, firstOpen_);
+  code = statements_.deleteOpenRows.run();
+  firstOpen_ = next_;
+  openBytes_ = 0;
+  return code;
+}
+
+SqliteCode MessageBlocks::sealOpenRows() {
+  const SqliteCode code = gatherOpenRows();
+  return code == SQLITE_OK ? insert(Row::kSealed) : code;
+}
+
+// Adds the records of a block to writer_. Those older than `newerThan` become gaps.
+SqliteCode MessageBlocks::gatherBlock(std::string_view block, std::int64_t records,
+                                      std::optional<double> newerThan) {
+  reader_.open(block, records);
+  while (reader_.next()) {
+    const BlockRecord& record = reader_.record();
+    const bool isAged = newerThan.has_value() && record.time < *newerThan;
+    if (record.kind == BlockRecordKind::kGap || isAged) {
+      writer_.addGap();
+      continue;
+    }
+    note(record.time);
+    if (record.kind == BlockRecordKind::kEvent) {
+      writer_.addEvent(record.time, {record.name, record.application}, record.payload);
+    } else {
+      const LinkParty party{record.sessionID, std::string(record.clientName),
+                            std::string(record.serviceName)};
+      writer_.addLink(record.time,
+                      {party, static_cast<std::uint16_t>(record.category),
+                       static_cast<std::uint16_t>(record.type)},
+                      record.payload);
+    }
+  }
+  return reader_.isDamaged() ? SQLITE_CORRUPT : SQLITE_OK;
+}
+
+void MessageBlocks::note(double time) {
+  const bool isFirst = !std::exchange(gathered_.hasTimes, true);
+  gathered_.firstTime = isFirst ? time : std::min(gathered_.firstTime, time);
+  gathered_.lastTime = isFirst ? time : std::max(gathered_.lastTime, time);
+}
+
+SqliteCode MessageBlocks::addEvent(double time, const EventHead& head, std::string_view payload) {
+  if (writer_.records() == 0) gathered_.first = next_;
+  note(time);
+  writer_.addEvent(time, head, payload);
+  return afterAdding();
+}
+
+SqliteCode MessageBlocks::addLink(double time, const LinkHead& head, std::string_view payload) {
+  if (writer_.records() == 0) gathered_.first = next_;
+  note(time);
+  writer_.addLink(time, head, payload);
+  return afterAdding();
+}
+
+SqliteCode MessageBlocks::afterAdding() {
+  ++next_;
+  const bool isFull = writer_.records() >= kMostRecords || writer_.bytes() >= kMostBytes;
+  return isFull ? insert(Row::kSealed) : SQLITE_OK;
+}
+
+SqliteCode MessageBlocks::end() {
+  if (writer_.records() == 0) return SQLITE_OK;
+  return insert(writer_.records() >= kRecordsToSeal ? Row::kSealed : Row::kOpen);
+}
+
+// Writes writer_'s records into a row.
+SqliteCode MessageBlocks::insert(Row row) {
+  const bool isShort = row == Row::kOpen && writer_.records() < kRecordsToCompress;
+  const std::string_view block =
+      writer_.finish(isShort ? BlockPacking::kPlain : BlockPacking::kZstd);
+  statements_.insertBlock.bind(1, gathered_.first);
+  statements_.insertBlock.bind(2, static_cast<std::int64_t>(writer_.records()));
+  statements_.insertBlock.bind(3, gathered_.firstTime);
+  statements_.insertBlock.bind(4, gathered_.lastTime);
+  statements_.insertBlock.bind(5, std::as_bytes(std::span(block)));
+  SqliteCode code = statements_.insertBlock.run();
+  if (row == Row::kOpen) {
+    openBytes_ += block.size();
+  } else {
+    if (code == SQLITE_OK) code = insertSpan();
+    firstOpen_ = next_;
+  }
+  clearGathered();
+  return code;
+}
+
+SqliteCode MessageBlocks::insertSpan() {
+  statements_.insertSpan.bind(1, gathered_.first);
+  statements_.insertSpan.bind(2, gathered_.firstTime);
+  statements_.insertSpan.bind(3, gathered_.lastTime);
+  const std::string_view keys = writer_.keys();
+  statements_.insertSpan.bind(4, std::as_bytes(std::span(keys)));
+  return statements_.insertSpan.run();
+}
+
+void MessageBlocks::clearGathered() {
+  if (writer_.records() > 0) sealedBytes_ += writer_.bytes();
+  writer_.clear();
+  gathered_ = {};
+}
+
+void MessageBlocks::onRolledBack() {
+  isStateKnown_ = false;
+  clearGathered();
+  sealedBytes_ = 0;
+}
+
+SqliteCode MessageBlocks::oldestTime(std::optional<double>& time) {
+  time.reset();
+  const SqliteCode code = statements_.oldest.step();
+  if (code == SQLITE_ROW) time = statements_.oldest.real(2);
+  statements_.oldest.reset();
+  return code == SQLITE_ROW || code == SQLITE_DONE ? SQLITE_OK : code;
+}
+
+SqliteCode MessageBlocks::deleteOldest(bool& found) {
+  SqliteCode code = readState();
+  if (code != SQLITE_OK) return code;
+  code = statements_.oldest.step();
+  found = code == SQLITE_ROW;
+  const std::int64_t id = found ? statements_.oldest.integer(0) : 0;
+  const std::int64_t records = found ? statements_.oldest.integer(1) : 0;
+  statements_.oldest.reset();
+  if (!found) return code == SQLITE_DONE ? SQLITE_OK : code;
+  return deleteRow(id, records);
+}
+
+SqliteCode MessageBlocks::deleteRow(std::int64_t id, std::int64_t records) {
+  statements_.deleteBlock.bind(1, id);
+  SqliteCode code = statements_.deleteBlock.run();
+  statements_.deleteSpan.bind(1, id);
+  if (code == SQLITE_OK) code = statements_.deleteSpan.run();
+  if (code != SQLITE_OK) return code;
+  if (id >= firstOpen_) firstOpen_ = id + records;
+  if (id + records != next_) return SQLITE_OK;
+  // This was the newest row. A row without records keeps the next number.
+  statements_.insertBlock.bind(1, next_);
+  statements_.insertBlock.bind(2, std::int64_t{0});
+  statements_.insertBlock.bind(3, 0.0);
+  statements_.insertBlock.bind(4, 0.0);
+  statements_.insertBlock.bind(5, std::span<const std::byte>());
+  return statements_.insertBlock.run();
+}
+
+SqliteCode MessageBlocks::deleteOlderThan(double time, bool& found) {
+  found = false;
+  SqliteCode code = readState();
+  if (code != SQLITE_OK) return code;
+  std::int64_t id = 0;
+  for (Statement* const aged : {&statements_.agedSpan, &statements_.agedOpenRow}) {
+    aged->bind(1, time);
+    code = aged->step();
+    found = code == SQLITE_ROW;
+    if (found) id = aged->integer(0);
+    aged->reset();
+    if (code != SQLITE_ROW && code != SQLITE_DONE) return code;
+    if (found) return trim(id, time);
+  }
+  return SQLITE_OK;
+}
+
+SqliteCode MessageBlocks::trim(std::int64_t id, double time) {
+  statements_.block.bind(1, id);
+  SqliteCode code = statements_.block.step();
+  if (code != SQLITE_ROW) {
+    statements_.block.reset();
+    return code == SQLITE_DONE ? SQLITE_CORRUPT : code;
+  }
+  const std::int64_t records = statements_.block.integer(0);
+  if (statements_.block.real(1) < time) {
+    statements_.block.reset();
+    return deleteRow(id, records);
+  }
+  clearGathered();
+  gathered_.first = id;
+  code = gatherBlock(statements_.block.bytes(2), records, time);
+  statements_.block.reset();
+  if (code != SQLITE_OK) return code;
+  const bool isOpen = id >= firstOpen_;
+  const std::int64_t firstOpen = firstOpen_;
+  code = insert(isOpen ? Row::kOpen : Row::kSealed);
+  firstOpen_ = firstOpen;
+  sealedBytes_ = 0;
+  return code;
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,108 @@
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string_view>
+
+#include "platform/linux/store/Sqlite.h"
+#include "platform/linux/store/blocks/MessageBlockReader.h"
+#include "platform/linux/store/blocks/MessageBlockWriter.h"
+
+namespace halvox::platform::linux_ {
+
+// The rows of `message_blocks`: each holds one or more consecutive records and has the number of
+// the first one as its ID. Numbers only grow, even after all records were deleted: readers that
+// follow the store rely on it.
+//
+//   open     few records, as they came in one transaction; the newest rows, without a span
+//   sealed   many records, compressed, with a row of `message_spans`
+//
+// A transaction of many records writes only sealed blocks. A transaction of few records writes an
+// open row, so that they are safe. When enough records have gathered, the open rows become one
+// sealed block with the same numbers. No timer does that: open rows of a quiet store stay, and
+// readers read them like all others.
+//
+// Owned by MessageRecords and used by the writer's thread only. Works in the open transaction,
+// except for prepare(). Functions that use the database return SQLITE_OK or an error; after an
+// error the caller rolls back and calls onRolledBack().
+//
+//   begin(); addEvent(), addLink() ...; end(); then onCommitted() or onRolledBack()
+class MessageBlocks {
+ public:
+  // Prepares the statements, after each opening of the database.
+  [[nodiscard]] SqliteCode prepare(Database& database);
+  // Finalizes all statements, before each closing of the database.
+  void release();
+
+  // Begins to write a transaction of about `records` records.
+  [[nodiscard]] SqliteCode begin(std::uint64_t records);
+  // See MessageBlockWriter.
+  [[nodiscard]] SqliteCode addEvent(double time, const EventHead& head, std::string_view payload);
+  [[nodiscard]] SqliteCode addLink(double time, const LinkHead& head, std::string_view payload);
+  // Writes what is not written yet.
+  [[nodiscard]] SqliteCode end();
+  // The length of this transaction's records before compression, in bytes.
+  [[nodiscard]] std::uint64_t bytes() const { return sealedBytes_ + writer_.bytes(); }
+
+  void onCommitted() { sealedBytes_ = 0; }
+  // Called after a failed transaction. Its numbers will be used again.
+  void onRolledBack();
+
+  // See RecordKind.
+  [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time);
+  [[nodiscard]] SqliteCode deleteOldest(bool& found);
+  // Deletes the records of one block that are older than `time`. If others remain, writes the block
+  // again with gaps.
+  [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found);
+
+ private:
+  enum class Row : std::uint8_t { kOpen, kSealed };
+  struct Statements {
+    Statement insertBlock;
+    Statement insertSpan;
+    Statement newest;
+    Statement newestSpan;
+    Statement openRows;
+    Statement deleteOpenRows;
+    Statement oldest;
+    Statement agedSpan;
+    Statement agedOpenRow;
+    Statement block;
+    Statement deleteBlock;
+    Statement deleteSpan;
+  };
+  // The records in writer_.
+  struct Gathered {
+    std::int64_t first = 0;  // the number of the first
+    bool hasTimes = false;
+    double firstTime = 0;
+    double lastTime = 0;
+  };
+
+  [[nodiscard]] SqliteCode readState();
+  [[nodiscard]] SqliteCode sealOpenRows();
+  [[nodiscard]] SqliteCode gatherOpenRows();
+  [[nodiscard]] SqliteCode gatherBlock(std::string_view block, std::int64_t records,
+                                       std::optional<double> newerThan);
+  void note(double time);
+  [[nodiscard]] SqliteCode afterAdding();
+  [[nodiscard]] SqliteCode insert(Row row);
+  [[nodiscard]] SqliteCode insertSpan();
+  void clearGathered();
+  [[nodiscard]] SqliteCode deleteRow(std::int64_t id, std::int64_t records);
+  [[nodiscard]] SqliteCode trim(std::int64_t id, double time);
+
+  Statements statements_;
+  MessageBlockWriter writer_;
+  MessageBlockReader reader_;
+  Gathered gathered_;
+  std::uint64_t sealedBytes_ = 0;  // of the blocks that this transaction has written
+
+  // Known after readState(). Unknown after opening the database and after a rollback.
+  bool isStateKnown_ = false;
+  std::int64_t next_ = 1;        // the number of the next record
+  std::int64_t firstOpen_ = 1;   // the number of the first record in an open row
+  std::uint64_t openBytes_ = 0;  // of the open rows
+};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,215 @@
+#include "platform/linux/store/reading/BlockScan.h"
+
+#include <algorithm>
+#include <functional>
+#include <limits>
+#include <utility>
+#include <vector>
+
+#include "platform/linux/store/reading/RecordScan.h"
+
+namespace halvox::platform::linux_ {
+namespace {
+
+// Clients choose names. Past this number they are matched each time.
+constexpr std::size_t kMostNames = 4096;
+constexpr std::int64_t kAfterAll = std::numeric_limits<std::int64_t>::max();
+
+}  // namespace
+
+SqliteCode BlockScan::readNumber(std::string_view sql, std::optional<std::int64_t> argument,
+                                 std::int64_t& number) {
+  Statement statement;
+  SqliteCode code = database_.prepare(sql, statement);
+  if (code != SQLITE_OK) return code;
+  if (argument.has_value()) statement.bind(1, *argument);
+  code = statement.step();
+  if (code == SQLITE_ROW) number = statement.integer(0);
+  return code == SQLITE_ROW || code == SQLITE_DONE ? SQLITE_OK : code;
+}
+
+SqliteCode BlockScan::begin() {
+  SqliteCode code =
+      readNumber("SELECT id + records - 1 FROM message_blocks ORDER BY id DESC LIMIT 1",
+                 std::nullopt, stored_);
+  last_ = stored_;
+  next_ = std::max<std::int64_t>(filter_.after + 1, 1);
+  if (code == SQLITE_OK) code = findRanges();
+  if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);
+  if (code != SQLITE_OK) return code;
+  // The row that has the number, or the first one after it.
+  return database_.prepare(
+      "SELECT id, records, block FROM message_blocks"
+      " WHERE id >= (SELECT ifnull(max(id), 0) FROM message_blocks WHERE id <= ?1)"
+      " AND id <= ?2 AND id + records > ?1 ORDER BY id LIMIT 1",
+      read_);
+}
+
+std::vector<BlockScan::Alternatives> BlockScan::wantedKeys() const {
+  std::vector<Alternatives> wanted;
+  const auto isPattern = [](const std::string& name) {
+    return name.find_first_of("*?[\\") != std::string::npos;
+  };
+  if (!filter_.names.empty() && std::ranges::none_of(filter_.names, isPattern)) {
+    Alternatives& names = wanted.emplace_back();
+    for (const std::string& name : filter_.names) {
+      names.push_back(blockKey(BlockKeyKind::kName, name));
+    }
+  }
+  if (kind_ == BlockRecordKind::kEvent) return wanted;
+  for (const NumberMatch& match : filter_.numbers) {
+    if (match.column != kLinkSessionID) continue;
+    Alternatives& sessions = wanted.emplace_back();
+    for (const std::int64_t session : match.numbers) sessions.push_back(sessionKey(session));
+  }
+  return wanted;
+}
+
+// The spans say which blocks may have records to read. Rows without a span are the newest ones, and
+// are few: they are always read.
+SqliteCode BlockScan::findRanges() {
+  Statement spans;
+  SqliteCode code = database_.prepare(
+      "SELECT span, first_time, last_time, keys FROM message_spans"
+      " WHERE span >= (SELECT ifnull(max(span), 0) FROM message_spans WHERE span <= ?1)"
+      " ORDER BY span",
+      spans);
+  if (code != SQLITE_OK) return code;
+  spans.bind(1, next_);
+  std::int64_t newestSpan = 0;
+  code = addRanges(spans, newestSpan);
+  if (code != SQLITE_OK) return code;
+  std::int64_t open = newestSpan;
+  code = readNumber("SELECT id + records FROM message_blocks WHERE id = ?1", newestSpan, open);
+  if (code != SQLITE_OK) return code;
+  const bool hasNewestSpan = !ranges_.empty() && ranges_.back().to == kAfterAll;
+  if (!hasNewestSpan) ranges_.push_back({open, kAfterAll});
+  return SQLITE_OK;
+}
+
+// Adds the ranges of the spans that may have records to read. The last one ends after all records
+// if it has the newest span, whose length is not known here.
+SqliteCode BlockScan::addRanges(Statement& spans, std::int64_t& newestSpan) {
+  const std::vector<Alternatives> wanted = wantedKeys();
+  const auto mayPass = [&] {
+    if (filter_.since.has_value() && spans.real(2) < *filter_.since) return false;
+    if (filter_.until.has_value() && spans.real(1) >= *filter_.until) return false;
+    const std::string_view keys = spans.bytes(3);
+    return std::ranges::all_of(wanted, [&](const Alternatives& alternatives) {
+      return std::ranges::any_of(alternatives, [&](BlockKey key) { return mayHave(keys, key); });
+    });
+  };
+  bool isInRange = false;
+  SqliteCode code = SQLITE_ROW;
+  while ((code = spans.step()) == SQLITE_ROW) {
+    newestSpan = spans.integer(0);
+    if (mayPass()) {
+      if (!std::exchange(isInRange, true)) ranges_.push_back({newestSpan, kAfterAll});
+    } else if (std::exchange(isInRange, false)) {
+      ranges_.back().to = newestSpan;
+    }
+  }
+  return code == SQLITE_DONE ? SQLITE_OK : code;
+}
+
+SqliteCode BlockScan::skipToNewest(std::uint64_t count) {
+  missing_ = count;
+  if (count == 0) {
+    next_ = last_ + 1;
+    return SQLITE_OK;
+  }
+  Statement rows;
+  SqliteCode code = database_.prepare(
+      "SELECT id, records, block FROM message_blocks"
+      " WHERE id >= (SELECT ifnull(max(id), 0) FROM message_blocks WHERE id <= ?1)"
+      " AND id <= ?2 AND id + records > ?1 ORDER BY id DESC",
+      rows);
+  for (std::size_t range = ranges_.size(); code == SQLITE_OK && range > 0 && missing_ > 0;) {
+    --range;
+    rows.bind(1, std::max(next_, ranges_[range].from));
+    rows.bind(2, std::min(last_, ranges_[range].to - 1));
+    while (missing_ > 0 && (code = rows.step()) == SQLITE_ROW) {
+      load(rows);
+      if (!countNewest()) return SQLITE_CORRUPT;
+    }
+    rows.reset();
+    if (code == SQLITE_ROW || code == SQLITE_DONE) code = SQLITE_OK;
+  }
+  return code;
+}
+
+// Counts the records of the loaded block that pass. When there are enough, reading begins with the
+// first of them. Returns false if the block is damaged.
+bool BlockScan::countNewest() {
+  std::vector<StoredRecordID> found;
+  while (nextRecord()) found.push_back(id());
+  if (found.size() >= missing_) next_ = found[found.size() - missing_];
+  missing_ -= std::min<std::uint64_t>(missing_, found.size());
+  return !isDamaged();
+}
+
+void BlockScan::load(const Statement& row) {
+  blockID_ = row.integer(0);
+  records_ = row.integer(1);
+  block_ = row.bytes(2);
+  reader_.open(block_, records_);
+}
+
+SqliteCode BlockScan::nextBlock(bool& found) {
+  if (std::exchange(found, false)) next_ = std::max(next_, blockID_ + records_);
+  while (range_ < ranges_.size() && next_ >= ranges_[range_].to) ++range_;
+  if (range_ == ranges_.size()) return SQLITE_OK;
+  next_ = std::max(next_, ranges_[range_].from);
+  if (next_ > last_) return SQLITE_OK;
+  read_.bind(1, next_);
+  read_.bind(2, last_);
+  const SqliteCode code = read_.step();
+  found = code == SQLITE_ROW;
+  if (found) load(read_);
+  read_.reset();
+  return code == SQLITE_ROW || code == SQLITE_DONE ? SQLITE_OK : code;
+}
+
+bool BlockScan::nextRecord() {
+  while (reader_.next()) {
+    const StoredRecordID number = id();
+    if (number < next_ || number > last_) continue;
+    if (reader_.record().kind == kind_ && passes(reader_.record())) return true;
+  }
+  return false;
+}
+
+bool BlockScan::passes(const BlockRecord& record) {
+  if (!isWithinTimes(filter_, record.time)) return false;
+  if (kind_ == BlockRecordKind::kEvent) return hasName(record.name);
+  for (const NumberMatch& match : filter_.numbers) {
+    const std::int64_t number = match.column == kLinkSessionID  ? record.sessionID
+                                : match.column == kLinkCategory ? record.category
+                                                                : record.type;
+    if (std::ranges::find(match.numbers, number) == match.numbers.end()) return false;
+  }
+  if (!hasName(record.serviceName)) return false;
+  return !filter_.accepts || filter_.accepts(linkRecord(id(), record));
+}
+
+bool BlockScan::hasName(std::string_view name) {
+  if (filter_.names.empty()) return true;
+  const auto known = names_.find(name);
+  if (known != names_.end()) return known->second;
+  const bool matches = matchesAny(filter_.names, std::string(name));
+  if (names_.size() < kMostNames) names_.emplace(name, matches);
+  return matches;
+}
+
+StoredRecord linkRecord(StoredRecordID id, const BlockRecord& record) {
+  StoredRecord made{id, record.time, {}};
+  made.fields = {record.sessionID,
+                 std::string(record.clientName),
+                 std::string(record.serviceName),
+                 record.category,
+                 record.type,
+                 std::string(record.payload)};
+  return made;
+}
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,93 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/linux/store/Sqlite.h"
+#include "platform/linux/store/blocks/BlockKeys.h"
+#include "platform/linux/store/blocks/MessageBlockReader.h"
+#include "platform/linux/store/reading/StoreReader.h"
+
+namespace halvox::platform::linux_ {
+
+// One pass over the events or the link messages in blocks that pass a filter. Copies one block at a
+// time and holds no snapshot while its records are used: see StoreReader. Meanwhile the store may
+// join blocks. Numbers do not change, so that the pass meets each record once. The pass ends with
+// the last record that was stored when it began. Belongs to the thread of its database and does not
+// own its arguments. After an error the scan is over.
+//
+//   begin(); bool found = false; then nextBlock(found), and nextRecord() while it is true, until
+//   nothing is found
+class BlockScan {
+ public:
+  BlockScan(Database& database, BlockRecordKind kind, const RecordFilter& filter)
+      : database_(database), kind_(kind), filter_(filter) {}
+
+  // Finds the first and the last record to read. Call once.
+  [[nodiscard]] SqliteCode begin();
+  // How many of RecordFilter::newest must come from before all blocks.
+  [[nodiscard]] std::uint64_t missing() const { return missing_; }
+
+  // Loads the next block that may have records to read. `found` must be what the call before left
+  // in it, and false for the first one.
+  [[nodiscard]] SqliteCode nextBlock(bool& found);
+  // Moves to the next record of the block that passes. Its views are valid until the next call.
+  [[nodiscard]] bool nextRecord();
+  [[nodiscard]] const BlockRecord& record() const { return reader_.record(); }
+  [[nodiscard]] StoredRecordID id() const { return blockID_ + reader_.index(); }
+  // True after nextRecord() came to damage. The scan is over then.
+  [[nodiscard]] bool isDamaged() const { return reader_.isDamaged(); }
+
+  // The last record that the whole pass looks at, whether the filter lets it through or not; known
+  // after begin(). 0 if there are no blocks.
+  [[nodiscard]] StoredRecordID last() const { return stored_; }
+
+ private:
+  // The numbers from `from` to before `to`.
+  struct Range {
+    std::int64_t from;
+    std::int64_t to;
+  };
+  // At least one of these keys is in each block with records that pass.
+  using Alternatives = std::vector<BlockKey>;
+
+  [[nodiscard]] std::vector<Alternatives> wantedKeys() const;
+  [[nodiscard]] SqliteCode findRanges();
+  [[nodiscard]] SqliteCode addRanges(Statement& spans, std::int64_t& newestSpan);
+  [[nodiscard]] SqliteCode skipToNewest(std::uint64_t count);
+  [[nodiscard]] bool countNewest();
+  [[nodiscard]] SqliteCode readNumber(std::string_view sql, std::optional<std::int64_t> argument,
+                                      std::int64_t& number);
+  void load(const Statement& row);
+  [[nodiscard]] bool passes(const BlockRecord& record);
+  [[nodiscard]] bool hasName(std::string_view name);
+
+  Database& database_;
+  const BlockRecordKind kind_;
+  const RecordFilter& filter_;
+  // The numbers to read: those from next_ to last_ that are in ranges_. The ranges are in ascending
+  // order; those before range_ are read.
+  std::int64_t next_ = 1;
+  std::int64_t last_ = 0;
+  std::vector<Range> ranges_;
+  std::size_t range_ = 0;
+  StoredRecordID stored_ = 0;
+  std::uint64_t missing_ = 0;
+  Statement read_;
+  std::string block_;
+  std::int64_t blockID_ = 0;
+  std::int64_t records_ = 0;
+  MessageBlockReader reader_;
+  std::map<std::string, bool, std::less<>> names_;  // which names pass
+};
+
+// A link message in the form that all kinds have.
+[[nodiscard]] StoredRecord linkRecord(StoredRecordID id, const BlockRecord& record);
+
+}  // namespace halvox::platform::linux_
