@@ -1,15 +1,21 @@
 // The cost of one message in the store: two events with equal payloads of 14 fields.
 
+#include <array>
 #include <chrono>
 #include <filesystem>
+#include <fstream>
 #include <functional>
 #include <memory>
+#include <random>
 #include <string>
 #include <thread>
+#include <vector>
 
 #include <benchmark/benchmark.h>
 #include <sys/resource.h>
+#include <unistd.h>
 
+#include "bench/TypicalMessage.h"
 #include "platform/linux/store/PayloadEncoder.h"
 #include "platform/linux/store/SqliteAnalyticsService.h"
 #include "platform/linux/store/SqliteStore.h"
@@ -81,6 +87,16 @@ struct Bench {
     std::filesystem::remove_all(directory);
   }
 
+  // The message as the local link sends it.
+  void sendLink(const Dictionary& message) {
+    Dictionary payload = message;
+    payload.set("audiotag", "Session_PlaybackStart");
+    store->linkMessages().add({.time = clock.currentDate().secondsSince1970,
+                               .party = party,
+                               .category = 4,
+                               .type = 1,
+                               .payload = payload});
+  }
   void send(const Dictionary& message) {
     const std::string first = "com.tarno.halvox.Session_Playback.Start";
     const std::string second = "com.tarno.longformaudio.Session_Playback.Start";
@@ -97,7 +113,50 @@ struct Bench {
   Backpressure backpressure;
   std::unique_ptr<SqliteStore> store;
   std::unique_ptr<SqliteAnalyticsService> service;
+  std::shared_ptr<const LinkParty> party =
+      std::make_shared<LinkParty>(LinkParty{7, "com.tarno.halvox", "longformaudio_session"});
 };
+
+// The bytes that this process has had written to disk.
+double writtenBytes() {
+  std::ifstream file("/proc/self/io");
+  std::string name;
+  double bytes = 0;
+  while (file >> name >> bytes) {
+    if (name == "write_bytes:") return bytes;
+  }
+  return 0;
+}
+
+// Some words, different ones for each number.
+std::string words(std::uint64_t number, int count) {
+  constexpr std::array kWords{"open",  "device",  "stream", "failed", "route",  "speaker",
+                              "mixer", "headset", "buffer", "late",   "glitch", "render"};
+  std::minstd_rand random(static_cast<std::uint32_t>(number + 1));
+  std::string text;
+  for (int word = 0; word < count; ++word) {
+    if (word > 0) text += ' ';
+    text += kWords[random() % kWords.size()];
+    if (random() % 3 == 0) text += '-' + std::to_string(random() % 100'000);
+  }
+  return text;
+}
+
+// A message of a client that runs: a counter and the stamps change, or texts too.
+Dictionary messageOf(std::int64_t number, bool isVaried) {
+  Dictionary message = bench::makeMessage(512 * number);
+  if (isVaried) {
+    const auto seed = static_cast<std::uint64_t>(4 * number);
+    message.set("route", words(seed, 5));
+    message.set("device_uid", words(seed + 1, 5));
+    message.set("format", words(seed + 2, 12));
+    message.set("latency_ms", 0.001 * static_cast<double>(number * 7919 % 1'000'000));
+  }
+  message.set("hvreporting_timestamp", 1'700'000'000.123 + 13e-6 * static_cast<double>(number));
+  message.set("systemuptime_sec", 86'400 + number / 70'000);
+  message.set("processuptime_ms", 123'456 + number / 70);
+  return message;
+}
 
 double cpuSeconds(int who) {
   struct rusage use {};
@@ -145,6 +204,46 @@ BENCHMARK(storeMessage)
     ->Iterations(8000)
     ->Unit(benchmark::kMicrosecond)
     ->UseRealTime();
+
+// What a store costs that takes both events and the link message of each message: CPU of the whole
+// process beside that of making the messages, bytes written to disk, bytes of the closed file.
+void storeAll(benchmark::State& state) {
+  const bool isVaried = state.range(0) == 1;
+  constexpr std::int64_t kMessages = 300'000;
+  constexpr std::size_t kPrepared = 20'000;
+  std::vector<Dictionary> messages;
+  for (std::size_t number = 0; number < kPrepared; ++number) {
+    messages.push_back(messageOf(static_cast<std::int64_t>(number), isVaried));
+  }
+  for (auto iteration : state) {
+    Bench bench(static_cast<std::uint32_t>(state.range(1)));
+    const double cpu = cpuSeconds(RUSAGE_SELF);
+    const double bytes = writtenBytes();
+    for (std::int64_t number = 0; number < kMessages; ++number) {
+      const Dictionary& message = messages[static_cast<std::size_t>(number) % kPrepared];
+      bench.send(message);
+      bench.sendLink(message);
+      while (bench.backpressure.isHigh()) {
+        std::this_thread::sleep_for(std::chrono::milliseconds(1));
+      }
+    }
+    bench.store->close();
+    ::sync();
+    const double each = 1.0 / kMessages;
+    state.counters["cpu_us_per_message"] = (cpuSeconds(RUSAGE_SELF) - cpu) * 1e6 * each;
+    state.counters["written_per_message"] = (writtenBytes() - bytes) * each;
+    state.counters["stored_per_message"] =
+        static_cast<double>(std::filesystem::file_size(bench.directory / "halvox.db")) * each;
+  }
+}
+BENCHMARK(storeAll)
+    ->ArgNames({"varied", "megabytes"})
+    ->Args({0, 512})
+    ->Args({1, 512})
+    ->Args({0, 16})
+    ->Args({1, 16})
+    ->Iterations(1)
+    ->Unit(benchmark::kMillisecond);
 
 // The caller's side alone: two names tested and two events queued. Timing pauses while the writer
 // catches up.
