@@ -1,4 +1,5 @@
 #include "service/ServiceFixture.h"
+#include "session/HistoryFixture.h"
 
 namespace halvox {
 namespace {
@@ -27,7 +28,7 @@ class HVReportingClientServerInstanceMessagesTest : public ServiceFixture {
   static Dictionary recorded(const Connection& from, std::int64_t id, std::size_t position = 0) {
     const auto session = sessionOf(from, id);
     const auto history = session->nestedAggregatedPayloadData();
-    return (**history)[position].message();
+    return messagesOf(**history).at(position).message;
   }
   static Dictionary stamped() {
     return {{"a", 1},
