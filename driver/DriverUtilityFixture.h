@@ -10,6 +10,7 @@
 #include "driver/HVReportingDriverUtility.h"
 #include "platform/fake/FakePlatform.h"
 #include "session/HVReportingSession.h"
+#include "session/HistoryFixture.h"
 
 namespace halvox {
 // Shared by the tests of the sampler.
@@ -69,7 +70,9 @@ class DriverUtilityFixture : public testing::Test {
   std::vector<Dictionary> recorded() const {
     std::vector<Dictionary> messages;
     const auto history = session_->nestedAggregatedPayloadData();
-    for (const auto& entry : **history) messages.push_back(entry.message());
+    for (RecordedMessage& entry : messagesOf(**history)) {
+      messages.push_back(std::move(entry.message));
+    }
     return messages;
   }
 

@@ -1,6 +1,9 @@
+#include <utility>
+
 #include "platform/preferences.h"
 #include "service/ReportingQueue.h"
 #include "service/ServiceFixture.h"
+#include "session/HistoryFixture.h"
 
 namespace halvox {
 namespace {
@@ -44,13 +47,15 @@ class HVReportingServiceDelegateFeaturesTest : public ServiceFixture {
     std::vector<Dictionary> messages;
     const auto session = sessionOf(from, id);
     const auto history = session->nestedAggregatedPayloadData();
-    for (const auto& entry : **history) messages.push_back(entry.message());
+    for (RecordedMessage& entry : messagesOf(**history)) {
+      messages.push_back(std::move(entry.message));
+    }
     return messages;
   }
   static std::string identifier(const Connection& from, std::int64_t id) {
     const auto session = sessionOf(from, id);
     const auto history = session->nestedAggregatedPayloadData();
-    return (**history)[0].identifier();
+    return messagesOf(**history).at(0).identifier;
   }
   static Value at(const Dictionary& message, std::string_view key) {
     const Value* found = message.find(key);
