@@ -1,0 +1,45 @@
+"""scripts/lib/source_units.py puts together only what compiles together."""
+
+import sys
+import tempfile
+import unittest
+from pathlib import Path
+
+ROOT = Path(__file__).resolve().parents[2]
+sys.path.insert(0, str(ROOT / "scripts/lib"))
+
+from source_units import Source, plan  # noqa: E402
+
+
+class Units(unittest.TestCase):
+    def units(self, *texts):
+        sources = [Source(f"{i}.cpp", ("clang++",), text) for i, text in enumerate(texts)]
+        return [[source.path for source in unit.sources] for unit in plan(sources)]
+
+    def test_sources_with_names_of_their_own_share_a_unit(self):
+        self.assertEqual(self.units("namespace { int a() { return 1; } }", "namespace { int b() { return 1; } }"),
+                         [["0.cpp", "1.cpp"]])
+
+    def test_a_name_of_one_source_does_not_occur_in_another(self):
+        own = ("namespace { int kOne = 1; }", "namespace x { namespace { void kOne(int); } }",
+               "static int kOne() { return 1; }", "using kOne = int;", "namespace { struct kOne final {}; }",
+               "namespace kOne = std::chrono;", "namespace { constexpr int kOne[] = {1, 2}; }",
+               "namespace { enum class kOne : char { kA }; }")
+        for text in own:
+            self.assertEqual(len(self.units(text, "int f() { return kOne; }")), 2, text)
+            self.assertEqual(len(self.units("int f() { return kOne; }", text)), 2, text)
+
+    def test_names_in_comments_literals_and_functions_do_not_count(self):
+        own = "namespace { int kOne = 1; }"
+        for text in ("// kOne\nint f();", 'const char* f() { return "kOne"; }', "/* kOne */ int f();",
+                     'auto f() { return R"(" kOne)"; }'):
+            self.assertEqual(len(self.units(own, text)), 1, text)
+        self.assertEqual(len(self.units("int f() { int kOne = 1; return kOne; }", "int kOne() { return 1; }")), 1)
+
+    def test_sources_with_macros_stay_alone(self):
+        for text in ("#define A 1\n", "#undef A\n", "#  pragma pack(1)\n"):
+            self.assertEqual(len(self.units(text, "int f();\n")), 2, text)
+
+    def test_sources_with_other_options_stay_apart(self):
+        sources = [Source("a.cpp", ("clang++",), "int a();"), Source("b.cpp", ("clang++", "-DX"), "int b();")]
+        self.assertEqual(len(plan(sources)), 2)
