@@ -23,7 +23,7 @@ check() {
   shift
   echo "optional-parts: building without $part in $tree"
   # shellcheck disable=SC2086  # several options
-  cmake --preset dev -B "$tree" ${options[$part]} >/dev/null
+  cmake --preset dev -B "$tree" -DHALVOX_UNITY=ON ${options[$part]} >/dev/null
   cmake --build "$tree" --target "$@" >"$tree/build.log" || { tail -n 50 "$tree/build.log"; return 1; }
   echo "optional-parts: starting the service without $part"
   (cd tests/system && HALVOX_BIN="$PWD/../../$tree/bin" PYTHONDONTWRITEBYTECODE=1 \

@@ -28,6 +28,8 @@ TOKEN = re.compile(
 )
 DIRECTIVE = re.compile(r"^[ \t]*#[ \t]*(\w+)(?:\\\n|[^\n])*", re.MULTILINE)
 INCLUDE = re.compile(r'^\s*#\s*include\s*"([^"]+)"', re.MULTILINE)
+# What looks like the declaration of a function.
+TESTS = {"TEST", "TEST_F", "TEST_P", "TYPED_TEST", "TYPED_TEST_P", "INSTANTIATE_TEST_SUITE_P"}
 DECLARES = {"class", "struct", "union", "enum", "using", "concept", "namespace"}
 NO_NAMES = DECLARES | set(
     """alignas auto bool char const constexpr decltype double explicit final float int long noexcept
@@ -81,17 +83,18 @@ def own_names(tokens):
         elif (static or any(anonymous)) and before not in ("::", "."):
             if before in DECLARES or following in AFTER_NAME:
                 names.add(token)
-    return names - NO_NAMES
+    return names - NO_NAMES - TESTS
 
 
 @functools.cache
 def header(path):
-    """What a header of ours declares and includes: its types and aliases, the paths of headers."""
+    """What a header of ours declares and includes: its types and aliases, its variables, the paths of headers."""
     try:
         text = Path(path).read_text(encoding="utf-8")
     except OSError:  # of a library, or generated
-        return frozenset(), ()
-    return frozenset(types(words_and_marks(text))), tuple(INCLUDE.findall(text))
+        return frozenset(), frozenset(), ()
+    tokens = words_and_marks(text)
+    return frozenset(types(tokens)), frozenset(variables(tokens)), tuple(INCLUDE.findall(text))
 
 
 def types(tokens):
@@ -103,6 +106,17 @@ def types(tokens):
         if is_word and depth == 0 and before in DECLARES - {"namespace"}:
             if following in ("{", ":", "=", "final"):
                 names.add(token)
+    return names
+
+
+def variables(tokens):
+    """The variables that are defined here outside of types and functions."""
+    names = set()
+    for i, (token, is_word, depth) in enumerate(with_depth(tokens)):
+        before = tokens[i - 1][0] if i else ";"
+        following = tokens[i + 1][0] if i + 1 < len(tokens) else ";"
+        if is_word and depth == 0 and following in ("=", "{", "[") and before not in DECLARES | {"::"}:
+            names.add(token)
     return names
 
 
@@ -130,19 +144,21 @@ def with_depth(tokens):
         yield token, is_word, depth
 
 
-def types_of_headers(text):
-    """The types of all headers of ours that a source includes: each with the header's path."""
+def names_of_headers(text):
+    """The types, each with its header's path, and the variables of all headers of ours that a source includes."""
     found = {}
+    values = set()
     seen = set()
     paths = INCLUDE.findall(text)
     while paths:
         path = paths.pop()
         if path not in seen:
             seen.add(path)
-            names, included = header(path)
+            names, defined, included = header(path)
             found.update(dict.fromkeys(names, path))
+            values |= defined
             paths.extend(included)
-    return found
+    return found, values
 
 
 @dataclass
@@ -160,7 +176,9 @@ class Source:
         tokens = words_and_marks(self.text)
         self.names = own_names(tokens)
         self.words = {token for token, is_word in tokens if is_word}
-        self.types = types_of_headers(self.text)
+        self.types, variables_of_headers = names_of_headers(self.text)
+        # A name of its own that a header of another source also defines would be ambiguous there.
+        self.words |= variables_of_headers - self.names
 
 
 @dataclass
