@@ -14,7 +14,7 @@ namespace {
 constexpr std::size_t kMostBytes = std::size_t{1} << 30U;
 constexpr std::size_t kMostFrames = std::size_t{1} << 24U;
 // Memory that is touched in advance: as much as a burst needs while the client's thread keeps up. A
-// page fault would cost an audio thread more than the whole message.
+// page fault would cost an audio thread more than the whole message. A multiple of any page.
 constexpr std::size_t kTouchedBytes = std::size_t{256} * 1024;
 
 // The high half of a word counts, the low half is the number of a cell + 1, or 0 for none.
@@ -205,6 +205,18 @@ void FrameRing::release() {
   pushCells(taken_);
   taken_ = {};
   released_.store(head_, std::memory_order_release);
+  touchAhead();
+}
+
+// Has the kernel map what the producers need next. Kernels before 5.14 refuse; the producers then
+// have the page faults.
+void FrameRing::touchAhead() {
+  const std::size_t all = std::size_t{cells_} * kCellBytes;
+  const std::size_t used = std::size_t{fresh_.load(std::memory_order_relaxed)} * kCellBytes;
+  if (touched_ >= all || used + kTouchedBytes / 2 <= touched_) return;
+  const std::size_t end = std::min((used / kTouchedBytes + 2) * kTouchedBytes, all);
+  madvise(memory_.get() + touched_, end - touched_, MADV_POPULATE_WRITE);
+  touched_ = end;
 }
 
 }  // namespace halvox::client

@@ -94,6 +94,7 @@ class FrameRing {
   [[nodiscard]] bool isFull(std::uint64_t newest) const;
   [[nodiscard]] bool publish(CellNumber first, std::size_t bytes);
   bool takeList();
+  void touchAhead();
 
   const std::uint32_t maxFrames_;
   const CellNumber cells_;
@@ -116,6 +117,7 @@ class FrameRing {
   alignas(64) std::uint64_t head_ = 0;
   CellNumber oldest_ = kNoCell;  // the consumer's list, in the order of the frames
   Chain taken_;
+  std::size_t touched_ = 0;  // bytes from the start of the memory; 0: only what map() touches
 };
 
 }  // namespace halvox::client

@@ -18,11 +18,15 @@
 #include <pthread.h>
 #include <sys/mman.h>
 #include <sys/prctl.h>
+#include <sys/resource.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <ucontext.h>
 #include <unistd.h>
 
+#include "client/EncodedDictionary.h"
+#include "client/FrameRing.h"
+#include "client/RequestEncoder.h"
 #include "client/halvox.h"
 #include "client/testing/TestService.h"
 
@@ -220,6 +224,22 @@ TEST_F(RealTimeTest, ChangingANumberAndSendingAgainAllocatesNothing) {
   }));
 }
 
+TEST_F(RealTimeTest, AValueOfTheSameSizeReplacesTheOldOneWithoutAnAllocation) {
+  halvox_dictionary_set_date(message_.get(), "since", 1.0);
+
+  expectNothing(count([&] {
+    for (int number = 0; number < 100; ++number) {
+      halvox_dictionary_set_double(message_.get(), "sample_rate", number);
+      halvox_dictionary_set_bool(message_.get(), "is_running", number % 2 == 0);
+      halvox_dictionary_set_date(message_.get(), "since", number);
+      halvox_dictionary_set_string(
+          message_.get(), "device_uid",
+          number % 2 == 0 ? "alsa_output.pci-0000_00_1f.4" : "alsa_output.pci-0000_00_1f.5");
+      halvox_client_send(client_.get(), 7, message_.get(), 4, 18);
+    }
+  }));
+}
+
 TEST_F(RealTimeTest, SendingIntoAFullRingMakesNoneEither) {
   service_.setStalled(true);
 
@@ -235,6 +255,30 @@ TEST_F(RealTimeTest, SendingWithoutAServiceMakesNoneEither) {
       halvox::client::eventually([&] { return !halvox_client_is_connected(client_.get()); }));
 
   expectNothing(count([&] { sendMany(1000); }));
+}
+
+std::int64_t pageFaults() {
+  rusage usage{};
+  getrusage(RUSAGE_THREAD, &usage);
+  return usage.ru_minflt;
+}
+
+// More messages wait than ever before, but the client's thread has run since memory became scarce.
+TEST(RingMemoryTest, TheConsumerTouchesMemoryBeforeTheProducersNeedIt) {
+  constexpr int kMessages = 400;  // one cell of 512 bytes each
+  halvox::client::FrameRing ring(8192, std::size_t{4} << 20U);
+  const halvox::client::EncodedDictionary message{};
+  const halvox::client::EncodedMessageView view{std::nullopt, message, 4, 18};
+  for (int number = 0; number < kMessages; ++number) ring.tryPush(view);
+  ASSERT_TRUE(ring.isReady());
+  ring.take(nullptr);
+  ring.release();
+
+  const std::int64_t before = pageFaults();
+  for (int number = 0; number < kMessages; ++number) ring.tryPush(view);
+
+  EXPECT_EQ(ring.tail(), 2U * kMessages);
+  EXPECT_LT(pageFaults() - before, 3);  // 36 without that
 }
 
 // Bytes of this process that are in memory.
