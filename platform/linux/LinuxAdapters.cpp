@@ -43,17 +43,24 @@ SnapshotOptions snapshotOptions(const Configuration& configuration) {
   return options;
 }
 
+bool isTracingEnabled(FeatureFlagService& features) {
+  return features._os_feature_enabled_impl("Acoustat", "Tracing");
+}
+
 // If trace points are not available, the service runs without them and logs the reason at the
-// start.
-std::unique_ptr<KdebugService> makeKdebug(std::string& failure) {
+// start. LTTng maps the buffers of every session that records into each process that has loaded it,
+// so the service loads it only if somebody may want its trace points.
+TracePoints makeTracePoints(const Configuration& configuration, FeatureFlagService& features) {
+  if (!configuration.tracePoints && !isTracingEnabled(features)) {
+    return {std::make_unique<NoKdebugService>(), "none, diagnostics.trace_points is not true"};
+  }
   auto loaded = LttngKdebugService::load();
-  if (loaded) return *std::move(loaded);
-  failure = std::move(loaded).error().message;
-  return std::make_unique<NoKdebugService>();
+  if (loaded) return {*std::move(loaded), "LTTng"};
+  return {std::make_unique<NoKdebugService>(), "none, " + loaded.error().message};
 }
 
 TraceOptions traceOptions(const Configuration& configuration, FeatureFlagService& features) {
-  const bool isEnabled = features._os_feature_enabled_impl("Acoustat", "Tracing");
+  const bool isEnabled = isTracingEnabled(features);
   return {.storageDirectory = configuration.storage.directory,
           .tracing = isEnabled ? Tracing::kEnabled : Tracing::kDisabled};
 }
@@ -88,13 +95,13 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
             return options;
           }(),
           backpressure),
-      kdebug(makeKdebug(kdebugFailure)),
+      featureFlags(configuration.features),
+      tracePoints(makeTracePoints(configuration, featureFlags)),
       log(QueuedLogService::onStandardError({configuration.logLevel, configuration.logMemoryLevel},
                                             statistics)),
       // Writes what is in the log's queue: its last line says why the process ends.
       process([this] { log->stop(); }),
       deviceProperties(configuration.device),
-      featureFlags(configuration.features),
       store(storeOptions(configuration), {clock, statistics, backpressure}),
       analytics(store, clock),
       diagnosticReporters(snapshotOptions(configuration),

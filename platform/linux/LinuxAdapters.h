@@ -37,6 +37,11 @@
 
 namespace halvox::platform::linux_ {
 
+struct TracePoints {
+  std::unique_ptr<KdebugService> service;
+  std::string description;  // for the log: "LTTng", or "none, " and why
+};
+
 // Every adapter of one process, in the order in which they need each other. Belongs to
 // LinuxPlatform, which opens and closes them. It has a header of its own because of its many
 // includes: only the two sources that compose the service include it.
@@ -56,13 +61,12 @@ struct LinuxAdapters {
   CounterStatisticsService statistics;
   Backpressure backpressure;
   LinuxConnectionService connections;
-  std::string kdebugFailure;
-  std::unique_ptr<KdebugService> kdebug;
+  ConfiguredFeatureFlagService featureFlags;
+  TracePoints tracePoints;
   std::unique_ptr<QueuedLogService> log;
   LibcClockService clock;
   ProcfsProcessService process;
   ConfiguredDevicePropertyService deviceProperties;
-  ConfiguredFeatureFlagService featureFlags;
   SqliteStore store;
   SqliteAnalyticsService analytics;
   SqliteSnapshotRecorder snapshotRecorder{store};

@@ -60,7 +60,7 @@ Services LinuxPlatform::services() {
           .featureFlags = adapters_->featureFlags,
           .files = adapters_->files,
           .ioReport = adapters_->ioReport,
-          .kdebug = *adapters_->kdebug,
+          .kdebug = *adapters_->tracePoints.service,
           .ktrace = adapters_->traces->ktrace(),
           .log = *adapters_->log,
           .metrics = adapters_->metrics,
@@ -130,8 +130,7 @@ void LinuxPlatform::logStart() const {
               busName(adapters_->configuration.listener.bus), ", store ",
               adapters_->configuration.storage.directory.string());
   log_.notice("link: ", linkName(adapters_->configuration.link.backend));
-  log_.notice("trace points: ",
-              adapters_->kdebugFailure.empty() ? "LTTng" : "none, " + adapters_->kdebugFailure);
+  log_.notice("trace points: ", adapters_->tracePoints.description);
   log_.notice("traces: ", adapters_->traces->description());
   if (adapters_->configuration.drivers.alsa && !hasAlsaSource()) {
     log_.notice("drivers.alsa = true needs HALVOX_ALSA, which this build does not have; ALSA's ",

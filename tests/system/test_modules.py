@@ -17,8 +17,9 @@ NATS, TRACING, PIPEWIRE = "halvox-link-nats.so", "halvox-tracing-lttng.so", "hal
 # No server listens there.
 NATS_CONFIG = '[link]\nbackend = "nats"\nservers = ["nats://127.0.0.1:1"]\n'
 TRACING_CONFIG = "[features.Acoustat]\nTracing = true\n"
-HEAVY = ("libnats", "libssl", "libcrypto", "libbabeltrace2", "liblttng-ctl", "libpipewire",
-         NATS, TRACING, PIPEWIRE)
+KDEBUG = "halvox-kdebug-lttng.so"
+HEAVY = ("libnats", "libssl", "libcrypto", "libbabeltrace2", "liblttng-ctl", "liblttng-ust.so", "libpipewire",
+         NATS, TRACING, KDEBUG, PIPEWIRE)
 
 
 def mapped(service):
@@ -53,6 +54,15 @@ class ModulesTest(unittest.TestCase):
 
         self.assertEqual(heavy(service), [])
         wait_for_line(service, "traces: none, features.Acoustat.Tracing is not true")
+        wait_for_line(service, "trace points: none, diagnostics.trace_points is not true")
+
+    def test_trace_points_are_loaded_when_they_are_configured(self):
+        self.require(KDEBUG)
+
+        service = self.service("[diagnostics]\ntrace_points = true\n").start()
+
+        self.assertEqual(heavy(service), ["liblttng-ust.so", KDEBUG])
+        wait_for_line(service, "trace points: LTTng")
 
     def test_the_link_to_nats_is_loaded_when_it_is_configured(self):
         self.require(NATS)
@@ -66,7 +76,7 @@ class ModulesTest(unittest.TestCase):
 
         service = self.service(TRACING_CONFIG).start()
 
-        self.assertEqual(heavy(service), ["libbabeltrace2", "liblttng-ctl", TRACING])
+        self.assertEqual(heavy(service), ["libbabeltrace2", "liblttng-ctl", "liblttng-ust.so", TRACING, KDEBUG])
         wait_for_line(service, "traces: LTTng")
 
     def test_the_tracer_is_loaded_when_an_earlier_service_left_a_recording(self):

@@ -25,7 +25,7 @@ class MarkedService(Service):
     """A service whose trace points are recorded by a tracer's daemon of its own."""
 
     def __init__(self, config=""):
-        super().__init__(config, command=[str(isolation.program("halvox-reportingd"))])
+        super().__init__(config + "[diagnostics]\ntrace_points = true\n", command=[str(isolation.program("halvox-reportingd"))])
         home = self.directory / "home"
         home.mkdir()
         self.trace = None

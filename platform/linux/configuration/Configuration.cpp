@@ -214,10 +214,11 @@ void readLog(TableReader table, Configuration& configuration) {
   table.finish();
 }
 
-void readDiagnostics(TableReader table, std::uint32_t& keepSnapshots) {
-  std::uint64_t keep = keepSnapshots;
+void readDiagnostics(TableReader table, Configuration& configuration) {
+  std::uint64_t keep = configuration.keepSnapshots;
   table.read("keep_snapshots", kSnapshots, keep);
-  keepSnapshots = static_cast<std::uint32_t>(keep);
+  configuration.keepSnapshots = static_cast<std::uint32_t>(keep);
+  table.read("trace_points", configuration.tracePoints);
   table.finish();
 }
 
@@ -278,7 +279,7 @@ Result<Configuration, ConfigurationError> parse(const std::string& file, std::st
   readLink(root.table("link"), configuration.link);
   readLimits(root.table("limits"), configuration.limits);
   readLog(root.table("log"), configuration);
-  readDiagnostics(root.table("diagnostics"), configuration.keepSnapshots);
+  readDiagnostics(root.table("diagnostics"), configuration);
   readFeatures(root.table("features"), configuration.features);
   configuration.device = root.table("device").readValues();
   readDrivers(root.table("drivers"), configuration.drivers);

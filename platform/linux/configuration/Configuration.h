@@ -85,6 +85,7 @@ struct Configuration {
   // The lowest level of the lines that the log keeps in memory for captures of diagnostics.
   LogLevel logMemoryLevel = LogLevel::kInfo;
   std::uint32_t keepSnapshots = defaults::kKeptSnapshots;
+  bool tracePoints = false;  // diagnostics.trace_points
   Dictionary device;         // [device]: property to value
   FeatureSwitches features;  // [features.Domain]: name to switch
 };

@@ -110,6 +110,7 @@ TEST(ConfigurationDocumentTest, TheDefaultsOfThePageAreTheDefaults) {
   EXPECT_EQ(page.logLevel, none.logLevel);
   EXPECT_EQ(page.logMemoryLevel, none.logMemoryLevel);
   EXPECT_EQ(page.keepSnapshots, none.keepSnapshots);
+  EXPECT_EQ(page.tracePoints, none.tracePoints);
 }
 
 }  // namespace

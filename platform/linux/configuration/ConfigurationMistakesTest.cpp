@@ -74,6 +74,8 @@ INSTANTIATE_TEST_SUITE_P(
         MistakeCase{"TooManySnapshots", "[diagnostics]\nkeep_snapshots = 10001",
                     "2:18: diagnostics.keep_snapshots: expected an integer from 1 to 10000, found "
                     "10001"},
+        MistakeCase{"TracePointsWithoutAFlag", "[diagnostics]\ntrace_points = 1",
+                    "2:16: diagnostics.trace_points: expected true or false, found 1"},
         MistakeCase{"SinkThatThisProgramLacks", "[analytics]\nsink = \"nats\"",
                     "2:8: analytics.sink: expected \"sqlite\", found the string \"nats\""},
         MistakeCase{"ElementType", "[analytics]\nwanted = [\"a\", 1]",

@@ -21,6 +21,7 @@ TEST_F(ConfigurationTest, MissingFileMeansDefaults) {
   EXPECT_EQ(configuration.logLevel, LogLevel::kDefault);
   EXPECT_EQ(configuration.logMemoryLevel, LogLevel::kInfo);
   EXPECT_EQ(configuration.keepSnapshots, 20U);
+  EXPECT_FALSE(configuration.tracePoints);
   EXPECT_EQ(configuration.analytics.wanted, std::vector<std::string>{"*"});
 }
 
@@ -127,6 +128,7 @@ level = "debug"
 memory_level = "error"
 [diagnostics]
 keep_snapshots = 3
+trace_points = true
 )");
 
   EXPECT_EQ(configuration.listener.socket, "/tmp/r.sock");
@@ -146,6 +148,7 @@ keep_snapshots = 3
   EXPECT_EQ(configuration.logLevel, LogLevel::kDebug);
   EXPECT_EQ(configuration.logMemoryLevel, LogLevel::kError);
   EXPECT_EQ(configuration.keepSnapshots, 3U);
+  EXPECT_TRUE(configuration.tracePoints);
 }
 
 TEST_F(ConfigurationTest, EveryUserMayConnectToAServiceOfTheSystem) {

@@ -9,7 +9,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Discards trace points. For a build or a machine without LTTng. Any thread may call.
+// Discards trace points. For a service that is not traced, and for a build or a machine without
+// LTTng. Any thread may call.
 class NoKdebugService final : public KdebugService {
  public:
   void kdebug_trace(std::uint32_t /*code*/, std::uint64_t /*argument1*/,
