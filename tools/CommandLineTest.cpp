@@ -10,12 +10,14 @@
 #include <gtest/gtest.h>
 
 #include "tools/Drivers.h"
+#include "tools/Export.h"
 #include "tools/Notify.h"
 #include "tools/Preferences.h"
 #include "tools/Records.h"
 #include "tools/Requests.h"
 #include "tools/Script.h"
 #include "tools/SnapshotFiles.h"
+#include "tools/Sql.h"
 #include "tools/Summary.h"
 #include "tools/Traces.h"
 
@@ -323,6 +325,32 @@ TEST(CommandLineTest, HelpShowsTheSocketOnlyForRequestsToTheService) {
     EXPECT_EQ(helpOf(words).find("--socket"), std::string::npos);
     EXPECT_EQ(helpOf(words).find("--timeout"), std::string::npos);
   }
+}
+
+TEST(CommandLineTest, SqlTakesAQueryOrReadsTheInput) {
+  const auto asked = [](const Words& words) {
+    return *std::get<Command>(parse(words)).asked<RunSql>();
+  };
+  EXPECT_EQ(asked({"sql", "SELECT 1", "--database", "/d"}).query, "SELECT 1");
+  EXPECT_EQ(asked({"sql", "SELECT 1", "--database", "/d"}).database, "/d");
+  EXPECT_EQ(asked({"sql"}).query, "");
+}
+
+TEST(CommandLineTest, ExportTakesAFileAndTimes) {
+  const auto parsed =
+      parse({"export", "--format", "sqlite", "--to", "f.db", "--since", "@5", "--until", "@9.5"});
+  const auto& request = *std::get<Command>(parsed).asked<ExportRecords>();
+  EXPECT_EQ(request.to, "f.db");
+  EXPECT_EQ(request.since, 5);
+  EXPECT_EQ(request.until, 9.5);
+  EXPECT_FALSE(request.replace);
+  EXPECT_TRUE(
+      std::get<Command>(parse({"export", "--to", "f", "--force"})).asked<ExportRecords>()->replace);
+}
+
+TEST(CommandLineTest, ExportNamesTheFormsThatItHas) {
+  EXPECT_NE(errorOf({"export", "--to", "f", "--format", "csv"}).find("sqlite"), std::string::npos);
+  EXPECT_NE(errorOf({"export"}).find("--to"), std::string::npos);
 }
 
 // The completion is a separate file, in which a new command is easily forgotten.

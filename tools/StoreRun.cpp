@@ -21,23 +21,6 @@ using platform::linux_::StoreReader;
 constexpr const char* kDatabaseName = "halvox.db";
 constexpr std::uint64_t kShownWhenFollowing = 10;
 
-// Returns the directory of the store, or the exit status if there is none.
-std::variant<std::filesystem::path, ExitStatus> storeDirectory(const StoreRun& run) {
-  const std::string& database = run.selection.database;
-  const Complaint complain(run.command, run.form, run.out, run.errors);
-  if (database.empty()) return findStore(complain);
-  const std::filesystem::path path(database);
-  std::error_code ignored;
-  if (std::filesystem::is_directory(path, ignored)) return path;
-  // The file may be missing: the reader of the store reports that with its own reason.
-  if (path.filename() == kDatabaseName) {
-    return path.has_parent_path() ? path.parent_path() : std::filesystem::path(".");
-  }
-  return complain(ExitStatus::kBadArguments, "--database: " + database +
-                                                 " is not a store; expected a " + kDatabaseName +
-                                                 " or the directory that has one");
-}
-
 ExitStatus cannotRead(const StoreRun& run, const Failure<StoreError>& failure) {
   return Complaint(run.command, run.form, run.out, run.errors)(ExitStatus::kNoService,
                                                                failure.message, "no-store");
@@ -71,6 +54,21 @@ ExitStatus follow(const StoreRun& run, const std::filesystem::path& directory,
 
 }  // namespace
 
+std::variant<std::filesystem::path, ExitStatus> storeDirectory(const std::string& database,
+                                                               const Complaint& complain) {
+  if (database.empty()) return findStore(complain);
+  const std::filesystem::path path(database);
+  std::error_code ignored;
+  if (std::filesystem::is_directory(path, ignored)) return path;
+  // The file may be missing: the reader of the store reports that with its own reason.
+  if (path.filename() == kDatabaseName) {
+    return path.has_parent_path() ? path.parent_path() : std::filesystem::path(".");
+  }
+  return complain(ExitStatus::kBadArguments, "--database: " + database +
+                                                 " is not a store; expected a " + kDatabaseName +
+                                                 " or the directory that has one");
+}
+
 RecordFilter filterOf(const RecordSelection& selection) {
   RecordFilter filter;
   filter.names = selection.names;
@@ -83,7 +81,8 @@ RecordFilter filterOf(const RecordSelection& selection) {
 
 ExitStatus runOverStore(const StoreRun& run, const RecordFilter& filter,
                         const StoreReading& reading) {
-  const auto directory = storeDirectory(run);
+  const auto directory =
+      storeDirectory(run.selection.database, {run.command, run.form, run.out, run.errors});
   if (const auto* status = std::get_if<ExitStatus>(&directory)) return *status;
   const auto& path = std::get<std::filesystem::path>(directory);
   if (run.selection.follow) return follow(run, path, filter, reading);

@@ -1,15 +1,18 @@
 #pragma once
 
 #include <cstdint>
+#include <filesystem>
 #include <functional>
 #include <optional>
 #include <ostream>
 #include <string>
+#include <variant>
 #include <vector>
 
 #include "platform/linux/store/reading/EventFollower.h"
 #include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Command.h"
+#include "tools/Complaint.h"
 
 namespace halvox::tools {
 
@@ -42,6 +45,11 @@ struct StoreReading {
 
 // Converts a selection to the filter of the store's reader.
 platform::linux_::RecordFilter filterOf(const RecordSelection& selection);
+
+// Returns the directory of the store that --database named, or else the one that this user's
+// programs find. Reports that there is none.
+std::variant<std::filesystem::path, ExitStatus> storeDirectory(const std::string& database,
+                                                               const Complaint& complain);
 
 // Opens the selected store and reads it once or, with --follow, until the output is closed or the
 // directory of the store is deleted.

@@ -10,6 +10,7 @@ void addRequestCommands(CommandSet& commands);   // create, send, list…: one r
 void addScriptRequests(CommandSet& commands);    // wait, sleep: only in scripts
 void addScriptCommands(CommandSet& commands);    // run, shell
 void addRecordCommands(CommandSet& commands);    // events, metrics, power, link
+void addQueryCommands(CommandSet& commands);     // sql, export
 void addSnapshotCommands(CommandSet& commands);  // snapshots
 void addSummaryCommand(CommandSet& commands);    // summary
 void addTraceCommands(CommandSet& commands);     // trace

@@ -19,6 +19,28 @@ platform::linux_::Result<double> parseTimeNow(std::string_view text) {
 
 }  // namespace
 
+void addTimes(CLI::App& app, std::optional<double>& since, std::optional<double>& until,
+              const char* records) {
+  addParsed(
+      app, "--since", since, parseTimeNow,
+      "Only " + std::string(records) +
+          " since then: a time that a command printed, \"2026-11-21 22:44\", RFC 3339 with an "
+          "offset, today, yesterday, how long ago (90s, 5min, 2h, 3d, 1w, also -5min), or "
+          "@SECONDS since 1970")
+      ->type_name("TIME");
+  addParsed(app, "--until", until, parseTimeNow,
+            "Only " + std::string(records) + " before then; TIME as for --since")
+      ->type_name("TIME");
+}
+
+void addDatabase(CLI::App& app, std::string& database) {
+  app.add_option("--database", database,
+                 "The store: a halvox.db or its directory (default: what the configuration names, "
+                 "else the user's, $XDG_STATE_HOME/halvox or ~/.local/state/halvox, if there is "
+                 "one, else the system's, /var/lib/halvox)")
+      ->type_name("FILE");
+}
+
 void addSelection(CLI::App& app, RecordSelection& selection, const char* records,
                   const char* names) {
   const std::string only = std::string("Only ") + records;
@@ -29,27 +51,14 @@ void addSelection(CLI::App& app, RecordSelection& selection, const char* records
         ->expected(1)
         ->take_all();
   }
-  addParsed(
-      app, "--since", selection.since, parseTimeNow,
-      only +
-          " since then: a time that a command printed, \"2026-11-21 22:44\", RFC 3339 with an "
-          "offset, today, yesterday, how long ago (90s, 5min, 2h, 3d, 1w, also -5min), or "
-          "@SECONDS since 1970")
-      ->type_name("TIME");
-  addParsed(app, "--until", selection.until, parseTimeNow,
-            only + " before then; TIME as for --since")
-      ->type_name("TIME");
+  addTimes(app, selection.since, selection.until, records);
   addParsed(app, "--last", selection.last, parseCount,
             "Only the newest N; 0 with --follow shows new ones only")
       ->type_name("N");
   app.add_flag("--follow", selection.follow,
                std::string("Keep showing ") + records +
                    " as they come; starts with the last 10 unless --since or --last is given");
-  app.add_option("--database", selection.database,
-                 "The store: a halvox.db or its directory (default: what the configuration names, "
-                 "else the user's, $XDG_STATE_HOME/halvox or ~/.local/state/halvox, if there is "
-                 "one, else the system's, /var/lib/halvox)")
-      ->type_name("FILE");
+  addDatabase(app, selection.database);
 }
 
 }  // namespace halvox::tools

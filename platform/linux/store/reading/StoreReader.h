@@ -97,6 +97,9 @@ class StoreReader {
   // open() again; record IDs may then start from 1.
   [[nodiscard]] bool isReplaced() const;
 
+  // The connection to the open store, for questions that are not about records.
+  [[nodiscard]] Database& database() { return database_; }
+
  private:
   [[nodiscard]] Failure<StoreError> failure(SqliteCode code) const;
   [[nodiscard]] Failure<StoreError> damagedBlock(StoredRecordID after) const;

@@ -1,0 +1,51 @@
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+
+#include "platform/linux/base/Result.h"
+#include "platform/linux/store/Sqlite.h"
+#include "platform/linux/store/reading/StoreReader.h"
+
+namespace halvox::platform::linux_ {
+
+// A database in which the five names of a store are plain tables with the same columns. Any program
+// that reads SQLite can read it without the store's extension.
+//
+//   create(); copyFrom(); finish()
+//
+// Belongs to one thread and one owner. Until finish() has succeeded, the content is in a file
+// `FILE.part`, which the destructor deletes.
+class StoreExport {
+ public:
+  explicit StoreExport(std::filesystem::path file);
+  StoreExport(const StoreExport&) = delete;
+  StoreExport& operator=(const StoreExport&) = delete;
+  ~StoreExport();
+
+  Result<void> create();
+  // Copies the records that pass the filter, of all kinds. Reads as StoreReader does: a service may
+  // write meanwhile. Returns why the store cannot be read or the file cannot be written.
+  Result<void> copyFrom(StoreReader& reader, const RecordFilter& filter);
+  // Gives the file its name. Replaces a file that has it.
+  Result<void> finish();
+
+  [[nodiscard]] std::uint64_t records() const { return records_; }
+
+ private:
+  Result<void> copyEvents(StoreReader& reader, const RecordFilter& filter);
+  Result<void> copyKind(std::string_view name, const RecordTable& table, StoreReader& reader,
+                        const RecordFilter& filter);
+  void insert(Statement& statement);
+  // Returns what became of reading a kind and of writing its rows.
+  [[nodiscard]] Result<void> outcome(const Result<void, StoreError>& read) const;
+  [[nodiscard]] Failure<> cannotWrite() const;
+
+  const std::filesystem::path file_;
+  const std::filesystem::path part_;
+  Database database_;
+  SqliteCode code_ = SQLITE_OK;  // the first error of writing
+  std::uint64_t records_ = 0;
+};
+
+}  // namespace halvox::platform::linux_

@@ -1,0 +1,108 @@
+#include "tools/Sql.h"
+
+#include <memory>
+#include <sstream>
+#include <string>
+
+#include <gmock/gmock.h>
+
+#include "client/testing/TestService.h"
+#include "platform/fake/FakePlatform.h"
+#include "platform/linux/store/SqliteAnalyticsService.h"
+#include "platform/linux/store/SqliteStore.h"
+
+namespace halvox::tools {
+namespace {
+
+using platform::linux_::Backpressure;
+using platform::linux_::SqliteAnalyticsService;
+using platform::linux_::SqliteStore;
+using platform::linux_::StoreOptions;
+using ::testing::HasSubstr;
+
+// A store with two events, 100 and 101 seconds after 1970.
+class SqlTest : public testing::Test {
+ protected:
+  SqlTest() {
+    StoreOptions options;
+    options.directory = scratch_.path("state");
+    options.retentionDays = 1'000'000;  // these events are old
+    store_ = std::make_unique<SqliteStore>(
+        options, SqliteStore::Environment{platform_.clock, platform_.statistics, backpressure_});
+    EXPECT_TRUE(store_->open());
+    SqliteAnalyticsService service(*store_, platform_.clock);
+    for (int number = 0; number < 2; ++number) {
+      platform_.clock.setCurrentDate({100.0 + number});
+      service.sendAnalyticsEventLazy("com.a\x1b[2J", [number] {
+        return platform::Dictionary{{"n", number}};
+      });
+    }
+    EXPECT_TRUE(client::eventually([this] { return store_->waiting() == 0; }));
+  }
+
+  ExitStatus run(const std::string& query, const std::string& input = "", bool isTerminal = false) {
+    output_.str("");
+    errors_.str("");
+    std::istringstream stream(input);
+    return runSql({.query = query, .database = scratch_.path("state")}, options_,
+                  {stream, output_, errors_, -1, isTerminal});
+  }
+  [[nodiscard]] std::string output() const { return output_.str(); }
+  [[nodiscard]] std::string errors() const { return errors_.str(); }
+
+  CommonOptions options_;
+
+ private:
+  client::ScratchDirectory scratch_;
+  platform::FakePlatform platform_;
+  Backpressure backpressure_;
+  std::unique_ptr<SqliteStore> store_;
+  std::ostringstream output_;
+  std::ostringstream errors_;
+};
+
+TEST_F(SqlTest, PrintsTheNamesOfTheColumnsAndTheRows) {
+  EXPECT_EQ(run("SELECT time, payload, NULL AS absent FROM analytics_events"), ExitStatus::kDone);
+  EXPECT_EQ(output(), "time\tpayload\tabsent\n100\t{\"n\":0}\t\n101\t{\"n\":1}\t\n");
+}
+
+TEST_F(SqlTest, PrintsAnObjectForEachRow) {
+  options_.json = true;
+  EXPECT_EQ(run("SELECT time, 'a\tb' AS text, NULL AS absent, 1 AS n, x'0aff' AS bytes"
+                " FROM analytics_events LIMIT 1"),
+            ExitStatus::kDone);
+  EXPECT_EQ(output(),
+            "{\"time\":100.0,\"text\":\"a\\tb\",\"absent\":null,\"n\":1,\"bytes\":\"0aff\"}\n");
+}
+
+TEST_F(SqlTest, EscapesWhatCouldControlTheTerminal) {
+  run("SELECT name FROM analytics_events");
+  EXPECT_THAT(output(), testing::Not(HasSubstr("\x1b")));
+}
+
+TEST_F(SqlTest, ReadsStatementsFromTheInput) {
+  EXPECT_EQ(run("", "SELECT 1 AS a;\nSELECT 2\n AS b;\n"), ExitStatus::kDone);
+  EXPECT_EQ(output(), "a\n1\nb\n2\n");
+  EXPECT_EQ(errors(), "");
+}
+
+TEST_F(SqlTest, EndsWithTheFirstError) {
+  EXPECT_EQ(run("SELECT 1 AS a; SELECT b; SELECT 3 AS c"), ExitStatus::kBadArguments);
+  EXPECT_EQ(output(), "a\n1\n");
+  EXPECT_THAT(errors(), HasSubstr("halvoxctl sql: no such column: b"));
+}
+
+TEST_F(SqlTest, AsksAtATerminalAndContinuesAfterAnError) {
+  EXPECT_EQ(run("", "SELECT b;\nSELECT 2\nAS b;\nquit\nSELECT 3 AS c;\n", true), ExitStatus::kDone);
+  EXPECT_EQ(output(), "b\n2\n");
+  EXPECT_THAT(errors(), HasSubstr("no such column: b"));
+  EXPECT_THAT(errors(), HasSubstr("halvox>    ...> halvox> "));
+}
+
+TEST_F(SqlTest, RefusesToChangeTheStore) {
+  EXPECT_EQ(run("DELETE FROM message_blocks"), ExitStatus::kBadArguments);
+  EXPECT_THAT(errors(), HasSubstr("only SELECT is allowed"));
+}
+
+}  // namespace
+}  // namespace halvox::tools
