@@ -136,7 +136,7 @@ class HalvoxClient {
   bool sendTo(std::span<const ReporterID> ids, const Dictionary& message, Category category,
               EventType type);
   // The same for a message that is kept in its encoded form (client/EncodedDictionary.h), which
-  // takes a third of the time.
+  // these only copy.
   bool send(ReporterID id, const EncodedDictionary& message, Category category, EventType type);
   bool sendTo(std::span<const ReporterID> ids, const EncodedDictionary& message, Category category,
               EventType type);

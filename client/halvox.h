@@ -308,8 +308,8 @@ HALVOX_API halvox_result halvox_client_destroy_session(halvox_client* client, in
  * client is ending; halvox_client_counters() counts both. `category` is a HALVOX_CATEGORY_...
  * number, optionally with a domain, `type` is a HALVOX_EVENT_... number.
  *
- * An audio thread may call the send functions: they encode the message, keep no reference to it,
- * and never block, allocate, take a lock or wait for the service. If no message was sent for 50 ms,
+ * An audio thread may call the send functions: they copy the message, keep no reference to it, and
+ * never block, allocate, take a lock or wait for the service. If no message was sent for 50 ms,
  * they make one system call, to wake the client's thread. With the option `real_time` they make
  * none while a session runs: the thread then looks for messages by itself, at least a hundred times
  * a second. */
