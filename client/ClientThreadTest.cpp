@@ -11,9 +11,9 @@ namespace {
 
 TEST(ClientThreadTest, RunsTheWorkAndWaitsForItsEnd) {
   std::atomic<bool> isCurrent{false};
+  std::atomic<bool> started{false};
   {
     ClientThread thread;
-    std::atomic<bool> started{false};
     thread.start([&] {
       started.wait(false);
       isCurrent = thread.isCurrent();
