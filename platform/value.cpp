@@ -115,6 +115,8 @@ Value::Value(Array array) noexcept {
 
 Value::Value(Dictionary dictionary) noexcept {
   setTag(Tag::kDictionary);
+  const auto count = static_cast<std::uint32_t>(dictionary.size());
+  std::memcpy(&storage_[4], &count, sizeof count);
   setPayload(dictionary.rep_.take());
 }
 
@@ -259,10 +261,13 @@ Array Value::array() const {
 Dictionary Value::dictionary() const {
   if (tag() != Tag::kDictionary) return {};
   retain();
-  return Dictionary(payload<DictionaryRep*>());
+  std::uint32_t count = 0;
+  std::memcpy(&count, &storage_[4], sizeof count);
+  return {payload<DictionaryRep*>(), count};
 }
 
-std::size_t Value::memorySize() const {
+// Only for a counted reference.
+std::size_t Value::heapSize() const {
   switch (tag()) {
     case Tag::kSharedString:
       return sizeof(StringRep) + payload<StringRep*>()->length;

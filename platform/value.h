@@ -122,9 +122,14 @@ class Key {
   // Bytes that this key alone keeps in memory; 0 for an interned key.
   [[nodiscard]] std::size_t memorySize() const;
 
-  friend bool operator==(const Key& left, const Key& right);
+  // True if both share one node. For a key that is interned, this is the same as being equal.
+  [[nodiscard]] bool sharesNode(const Key& other) const { return node_ == other.node_; }
+  friend bool operator==(const Key& left, const Key& right) {
+    return left.node_ == right.node_ || equalNodes(*left.node_, *right.node_);
+  }
 
  private:
+  static bool equalNodes(detail::KeyNode& left, detail::KeyNode& right);
   detail::Reference<detail::KeyNode> node_;
 };
 
@@ -252,7 +257,7 @@ class Value {
 
   // Bytes on the heap that this value keeps in memory. Shared bytes count for every holder, which
   // makes the sum an upper bound. The value's own 16 bytes do not count.
-  [[nodiscard]] std::size_t memorySize() const;
+  [[nodiscard]] std::size_t memorySize() const { return isCounted() ? heapSize() : 0; }
 
   friend bool operator==(const Value& left, const Value& right);
 
@@ -290,14 +295,15 @@ class Value {
   }
   void retain() const noexcept;
   void release() noexcept;
+  [[nodiscard]] std::size_t heapSize() const;
   void setNumber(NumberKind kind, std::int64_t number) noexcept;
   void setNumber(NumberKind kind, std::uint64_t number) noexcept;
   void setNumber(NumberKind kind, double number) noexcept;
   static bool equalNumbers(const Value& left, const Value& right);
 
-  // Byte 0 is the tag. A number, date or reference is in bytes 8 to 15. An inline string has its
-  // length in byte 1 and its text from byte 2 on. Sixteen bytes, because a dictionary entry has one
-  // and messages have dozens of entries.
+  // Byte 0 is the tag. A number, date or reference is in bytes 8 to 15. A dictionary's number of
+  // entries is in bytes 4 to 7. An inline string has its length in byte 1 and its text from byte 2
+  // on. Sixteen bytes, because a dictionary entry has one and messages have dozens of entries.
   alignas(8) unsigned char storage_[16] = {};
 };
 
@@ -329,6 +335,10 @@ class Array {
 // holder sees the change of another. Different threads may use different copies at once; one object
 // belongs to one thread at a time.
 //
+// One change needs no copy: a new entry behind all others, if reserve() has made room for it. Each
+// holder knows how many of the shared entries are its own. A message is thus stamped, tagged and
+// kept in one block of memory, although consumers hold it without its tag.
+//
 // Entries are enumerated in the order in which their keys were first set. A small dictionary is
 // searched key by key, a large one by an index with a secret hash. The time that a client's keys
 // cost is therefore proportional to their bytes, even if there are many or they are made to
@@ -343,7 +353,7 @@ class Dictionary {
   Dictionary() noexcept = default;
   Dictionary(std::initializer_list<Entry> entries);
 
-  [[nodiscard]] std::size_t size() const;
+  [[nodiscard]] std::size_t size() const { return rep_ == nullptr ? 0 : count_; }
   [[nodiscard]] bool empty() const { return size() == 0; }
   [[nodiscard]] const Entry* begin() const;
   [[nodiscard]] const Entry* end() const { return begin() + size(); }
@@ -362,6 +372,8 @@ class Dictionary {
   void reserve(std::size_t entries);
   // Sets the value under a key. An existing key keeps its position; a new one goes to the end.
   void set(const Key& key, Value value);
+  // Does the same for a key that the caller knows to be absent, without looking for it.
+  void add(const Key& key, Value value);
   // Sets the value of the entry at a position, which must be less than size().
   void setAt(std::size_t position, Value value);
   // Removes the entry under a key; returns false if there was none.
@@ -369,7 +381,9 @@ class Dictionary {
   // Sets every entry of `other`, in its order.
   void merge(const Dictionary& other);
 
-  [[nodiscard]] bool isIdenticalTo(const Dictionary& other) const { return rep_ == other.rep_; }
+  [[nodiscard]] bool isIdenticalTo(const Dictionary& other) const {
+    return rep_ == other.rep_ && size() == other.size();
+  }
   // Bytes on the heap that this dictionary keeps in memory, including shared ones.
   [[nodiscard]] std::size_t memorySize() const;
 
@@ -377,9 +391,12 @@ class Dictionary {
 
  private:
   friend class Value;
-  explicit Dictionary(detail::DictionaryRep* rep) : rep_(rep) {}
+  Dictionary(detail::DictionaryRep* rep, std::uint32_t count) : rep_(rep), count_(count) {}
   void makeRoomFor(std::size_t entries);
+  [[nodiscard]] bool isAlone() const;
+  [[nodiscard]] bool tryAddShared(const Key& key, Value& value);
   detail::Reference<detail::DictionaryRep> rep_;
+  std::uint32_t count_ = 0;  // meaningless without a node
 };
 
 // A message as the components pass it on. It may be absent: a client can send none.

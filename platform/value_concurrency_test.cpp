@@ -39,6 +39,23 @@ TEST(ValueConcurrencyTest, ThreadsCopyAndChangeOneDictionary) {
   EXPECT_FALSE(original.contains("thread"));
 }
 
+TEST(ValueConcurrencyTest, ThreadsAddToCopiesOfADictionaryWithRoom) {
+  for (int round = 0; round < 200; ++round) {
+    Dictionary original;
+    original.reserve(4);
+    original.set("a", 1);
+    const Dictionary& shared = original;
+    onSeveralThreads([&shared](int thread) {
+      Dictionary copy = shared;
+      copy.set("thread", thread);
+      ASSERT_EQ(copy.size(), 2U);
+      ASSERT_EQ(*copy.find("thread"), Value(thread));
+      ASSERT_EQ(shared.size(), 1U);
+    });
+    ASSERT_EQ(original, (Dictionary{{"a", 1}}));
+  }
+}
+
 TEST(ValueConcurrencyTest, TheLastHolderMayBeAnyThread) {
   for (int round = 0; round < 200; ++round) {
     std::vector<Value> copies(kThreads, Value(Dictionary{{"key", "a text that is on the heap"}}));

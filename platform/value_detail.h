@@ -72,10 +72,14 @@ struct ArrayRep {
   [[nodiscard]] Value* values() { return reinterpret_cast<Value*>(this + 1); }
 };
 
-// A dictionary's entries, in the order of setting. An empty dictionary has no node.
+// The entries of dictionaries, in the order of setting. A dictionary consists of the first entries,
+// as many as it knows. An entry that was added while several dictionaries shared the node belongs
+// to the one that added it. With an index, all of them have all entries.
 struct DictionaryRep {
   ReferenceCount references;
-  std::uint32_t count;
+  // The entries that were made. Relaxed: it only decides which dictionary may make the next one.
+  // Whoever reads that entry has got it from the one that made it.
+  std::atomic<std::uint32_t> used;
   std::uint32_t capacity;
   std::uint32_t indexSize;  // a power of two; 0 while the dictionary is small
   std::uint32_t* index;     // a slot holds the number of its entry plus 1; 0 if it is free

@@ -19,7 +19,7 @@ constexpr std::uint32_t kFirstCapacity = 4;
 Reference allocateRep(std::size_t capacity) {
   void* memory = detail::allocateNode<DictionaryRep>(capacity * sizeof(Dictionary::Entry));
   return Reference(new (memory)
-                       DictionaryRep{{1}, 0, static_cast<std::uint32_t>(capacity), 0, nullptr});
+                       DictionaryRep{{1}, {0}, static_cast<std::uint32_t>(capacity), 0, nullptr});
 }
 
 void addToIndex(DictionaryRep& rep, std::uint32_t entry) {
@@ -30,23 +30,23 @@ void addToIndex(DictionaryRep& rep, std::uint32_t entry) {
   rep.index[slot] = entry + 1;
 }
 
-void buildIndex(DictionaryRep& rep) {
+void buildIndex(DictionaryRep& rep, std::uint32_t count) {
   delete[] rep.index;
   rep.index = nullptr;
   rep.indexSize = 0;
-  if (rep.count <= kMaxWithoutIndex) return;
+  if (count <= kMaxWithoutIndex) return;
   // At most half full, which keeps the sequences of occupied slots short.
   rep.indexSize = 64;
-  while (rep.indexSize < 2 * rep.count) rep.indexSize *= 2;
+  while (rep.indexSize < 2 * count) rep.indexSize *= 2;
   rep.index = new std::uint32_t[rep.indexSize]();
-  for (std::uint32_t entry = 0; entry < rep.count; ++entry) addToIndex(rep, entry);
+  for (std::uint32_t entry = 0; entry < count; ++entry) addToIndex(rep, entry);
 }
 
-void noteAppended(DictionaryRep& rep) {
-  if (rep.indexSize >= 2 * rep.count) {
-    addToIndex(rep, rep.count - 1);
-  } else if (rep.count > kMaxWithoutIndex) {
-    buildIndex(rep);
+void noteAppended(DictionaryRep& rep, std::uint32_t count) {
+  if (rep.indexSize >= 2 * count) {
+    addToIndex(rep, count - 1);
+  } else if (count > kMaxWithoutIndex) {
+    buildIndex(rep, count);
   }
 }
 
@@ -59,26 +59,40 @@ void copyIndex(DictionaryRep& rep, const DictionaryRep& other) {
 }
 
 template <typename Matches>
-Dictionary::Entry* findEntry(const Reference& rep, std::string_view key, const Matches& matches) {
-  if (rep == nullptr) return nullptr;
-  Dictionary::Entry* entries = rep->entries();
-  if (rep->indexSize == 0) {
-    Dictionary::Entry* const end = entries + rep->count;
-    Dictionary::Entry* const found = std::find_if(entries, end, matches);
-    return found == end ? nullptr : found;
-  }
+Dictionary::Entry* findEntry(const Reference& rep, std::size_t count, const Matches& matches) {
+  Dictionary::Entry* const entries = rep->entries();
+  Dictionary::Entry* const end = entries + count;
+  Dictionary::Entry* const found = std::find_if(entries, end, matches);
+  return found == end ? nullptr : found;
+}
+
+template <typename Matches>
+Dictionary::Entry* findIndexedEntry(const Reference& rep, std::string_view key,
+                                    const Matches& matches) {
   const std::uint32_t mask = rep->indexSize - 1;
   std::uint32_t slot = detail::secretHash(key) & mask;
   for (; rep->index[slot] != 0; slot = (slot + 1) & mask) {
-    Dictionary::Entry& entry = entries[rep->index[slot] - 1];
+    Dictionary::Entry& entry = rep->entries()[rep->index[slot] - 1];
     if (matches(entry)) return &entry;
   }
   return nullptr;
 }
 
-Dictionary::Entry* findEntry(const Reference& rep, const Key& key) {
-  return findEntry(rep, key.text(),
-                   [&key](const Dictionary::Entry& entry) { return entry.key == key; });
+Dictionary::Entry* findEntry(const Reference& rep, std::size_t count, std::string_view key) {
+  if (rep == nullptr) return nullptr;
+  const auto matches = [key](const Dictionary::Entry& entry) { return entry.key.text() == key; };
+  return rep->indexSize == 0 ? findEntry(rep, count, matches) : findIndexedEntry(rep, key, matches);
+}
+
+Dictionary::Entry* findEntry(const Reference& rep, std::size_t count, const Key& key) {
+  if (rep == nullptr) return nullptr;
+  const auto matches = [&key](const Dictionary::Entry& entry) { return entry.key == key; };
+  if (rep->indexSize != 0) return findIndexedEntry(rep, key.text(), matches);
+  if (!key.isInterned()) return findEntry(rep, count, matches);
+  // Reads no key of the dictionary: a message is searched for several keys, nearly all of which it
+  // does not have.
+  return findEntry(rep, count,
+                   [&key](const Dictionary::Entry& entry) { return entry.key.sharesNode(key); });
 }
 
 }  // namespace
@@ -87,7 +101,7 @@ void detail::retain(DictionaryRep& node) noexcept { retain(node.references); }
 
 void detail::release(DictionaryRep& node) noexcept {
   if (!releaseLast(node.references)) return;
-  std::destroy_n(node.entries(), node.count);
+  std::destroy_n(node.entries(), node.used.load(std::memory_order_relaxed));
   delete[] node.index;
   node.~DictionaryRep();
   ::operator delete(&node);
@@ -98,47 +112,51 @@ Dictionary::Dictionary(std::initializer_list<Entry> entries) {
   for (const Entry& entry : entries) set(entry.key, entry.value);
 }
 
-std::size_t Dictionary::size() const { return rep_ == nullptr ? 0 : rep_->count; }
-
 const Dictionary::Entry* Dictionary::begin() const {
   return rep_ == nullptr ? nullptr : rep_->entries();
 }
 
 const Value* Dictionary::find(const Key& key) const {
-  const Entry* entry = findEntry(rep_, key);
+  const Entry* entry = findEntry(rep_, count_, key);
   return entry == nullptr ? nullptr : &entry->value;
 }
 
 const Value* Dictionary::find(std::string_view key) const {
-  const Entry* entry =
-      findEntry(rep_, key, [key](const Entry& candidate) { return candidate.key.text() == key; });
+  const Entry* entry = findEntry(rep_, count_, key);
   return entry == nullptr ? nullptr : &entry->value;
 }
+
+bool Dictionary::isAlone() const { return rep_->references.load(std::memory_order_acquire) == 1; }
 
 // Ensures that no other dictionary shares the content, and that there is room for `entries` entries
 // in total.
 void Dictionary::makeRoomFor(std::size_t entries) {
   if (rep_ == nullptr) {
     rep_ = allocateRep(std::max<std::size_t>(entries, kFirstCapacity));
+    count_ = 0;
     return;
   }
-  const bool alone = rep_->references.load(std::memory_order_acquire) == 1;
-  if (alone && entries <= rep_->capacity) return;
+  const bool alone = isAlone();
+  if (alone) {
+    // Entries of other dictionaries, which exist no longer.
+    const std::uint32_t used = rep_->used.exchange(count_, std::memory_order_relaxed);
+    std::destroy_n(rep_->entries() + count_, used - count_);
+    if (entries <= rep_->capacity) return;
+  }
   // The copy of a shared dictionary gets exactly the room that it needs, because it is usually
   // changed once and then kept. A dictionary that grows entry by entry grows by half of its size.
   const std::size_t capacity =
       alone ? std::max<std::size_t>(entries, rep_->capacity + rep_->capacity / 2) : entries;
   Reference grown = allocateRep(capacity);
   if (alone) {
-    std::uninitialized_move_n(rep_->entries(), rep_->count, grown->entries());
+    std::uninitialized_move_n(rep_->entries(), count_, grown->entries());
     std::swap(grown->index, rep_->index);
     std::swap(grown->indexSize, rep_->indexSize);
-    grown->count = rep_->count;
   } else {
-    std::uninitialized_copy_n(rep_->entries(), rep_->count, grown->entries());
-    grown->count = rep_->count;
+    std::uninitialized_copy_n(rep_->entries(), count_, grown->entries());
     copyIndex(*grown, *rep_);
   }
+  grown->used.store(count_, std::memory_order_relaxed);
   rep_ = std::move(grown);
 }
 
@@ -147,33 +165,57 @@ void Dictionary::reserve(std::size_t entries) {
 }
 
 void Dictionary::set(const Key& key, Value value) {
-  if (const Entry* existing = findEntry(rep_, key)) {
-    const auto position = existing - rep_->entries();
-    makeRoomFor(rep_->count);
-    rep_->entries()[position].value = std::move(value);
-    return;
-  }
+  const Entry* existing = findEntry(rep_, count_, key);
+  if (existing == nullptr) return add(key, std::move(value));
+  const auto position = existing - rep_->entries();
+  makeRoomFor(count_);
+  rep_->entries()[position].value = std::move(value);
+}
+
+void Dictionary::add(const Key& key, Value value) {
+  if (tryAddShared(key, value)) return;
   makeRoomFor(size() + 1);
-  new (rep_->entries() + rep_->count) Entry{key, std::move(value)};
-  ++rep_->count;
-  noteAppended(*rep_);
+  new (rep_->entries() + count_) Entry{key, std::move(value)};
+  rep_->used.store(++count_, std::memory_order_relaxed);
+  noteAppended(*rep_, count_);
+}
+
+// Adds an entry behind those of all holders, which do not see it. Returns false if that is not
+// possible.
+bool Dictionary::tryAddShared(const Key& key, Value& value) {
+  if (rep_ == nullptr || count_ >= rep_->capacity || count_ >= kMaxWithoutIndex) return false;
+  std::uint32_t expected = count_;
+  if (isAlone()) {
+    if (rep_->used.load(std::memory_order_relaxed) != expected) return false;
+    rep_->used.store(expected + 1, std::memory_order_relaxed);
+  } else {
+    // A container may hold this very dictionary, which would then hold itself and never be freed.
+    if (value.isArray() || value.isDictionary()) return false;
+    // Claims the entry: another holder may be about to add one too.
+    if (!rep_->used.compare_exchange_strong(expected, count_ + 1, std::memory_order_relaxed)) {
+      return false;
+    }
+  }
+  new (rep_->entries() + count_) Entry{key, std::move(value)};
+  ++count_;
+  return true;
 }
 
 void Dictionary::setAt(std::size_t position, Value value) {
-  makeRoomFor(rep_->count);
+  makeRoomFor(count_);
   rep_->entries()[position].value = std::move(value);
 }
 
 bool Dictionary::remove(const Key& key) {
-  const Entry* existing = findEntry(rep_, key);
+  const Entry* existing = findEntry(rep_, count_, key);
   if (existing == nullptr) return false;
   const auto position = existing - rep_->entries();
-  makeRoomFor(rep_->count);
+  makeRoomFor(count_);
   Entry* entries = rep_->entries();
-  std::move(entries + position + 1, entries + rep_->count, entries + position);
-  std::destroy_at(entries + rep_->count - 1);
-  --rep_->count;
-  buildIndex(*rep_);
+  std::move(entries + position + 1, entries + count_, entries + position);
+  std::destroy_at(entries + count_ - 1);
+  rep_->used.store(--count_, std::memory_order_relaxed);
+  buildIndex(*rep_, count_);
   return true;
 }
 
@@ -197,8 +239,8 @@ std::size_t Dictionary::memorySize() const {
 }
 
 bool operator==(const Dictionary& left, const Dictionary& right) {
-  if (left.rep_ == right.rep_) return true;
   if (left.size() != right.size()) return false;
+  if (left.rep_ == right.rep_) return true;
   // Try the same position first: repeated messages have their keys in the same order.
   const Dictionary::Entry* other = right.begin();
   for (const Dictionary::Entry& entry : left) {

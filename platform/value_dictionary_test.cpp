@@ -6,6 +6,7 @@
 #include <map>
 #include <random>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <gtest/gtest.h>
@@ -143,6 +144,103 @@ TEST(DictionaryTest, AKeyOrValueOfItsOwnCanBeSet) {
   dictionary.set(dictionary.begin()->key, (dictionary.begin() + 1)->value);
   EXPECT_EQ(*dictionary.find("copy"), Value(3));
   EXPECT_EQ(*dictionary.find("key 0"), Value(1));
+}
+
+TEST(DictionaryTest, AnEntryBehindAllOthersNeedsNoCopy) {
+  Dictionary original;
+  original.reserve(3);
+  original.set("a", 1);
+  original.set("b", 2);
+  Dictionary tagged = original;
+
+  tagged.set("c", "a text that is too long to be in its value");
+
+  EXPECT_EQ(tagged.begin(), original.begin());
+  EXPECT_EQ(original, (Dictionary{{"a", 1}, {"b", 2}}));
+  EXPECT_FALSE(original.contains("c"));
+  EXPECT_EQ(keysOf(tagged), (std::vector<std::string>{"a", "b", "c"}));
+  EXPECT_FALSE(tagged.isIdenticalTo(original));
+  EXPECT_NE(tagged, original);
+}
+
+TEST(DictionaryTest, OnlyOneHolderGetsTheEntryBehindAllOthers) {
+  Dictionary original;
+  original.reserve(3);
+  original.set("a", 1);
+  Dictionary first = original;
+  Dictionary second = original;
+
+  first.set("b", 1);
+  second.set("b", 2);
+  original.set("c", 3);
+
+  EXPECT_EQ(first, (Dictionary{{"a", 1}, {"b", 1}}));
+  EXPECT_EQ(second, (Dictionary{{"a", 1}, {"b", 2}}));
+  EXPECT_EQ(original, (Dictionary{{"a", 1}, {"c", 3}}));
+}
+
+TEST(DictionaryTest, TheEntryOfAHolderThatIsGoneIsReplaced) {
+  Dictionary original;
+  original.reserve(3);
+  original.set("a", 1);
+  {
+    Dictionary tagged = original;
+    tagged.set("b", "a text that is too long to be in its value");
+  }
+  original.set("c", 3);
+  EXPECT_EQ(original, (Dictionary{{"a", 1}, {"c", 3}}));
+}
+
+TEST(DictionaryTest, AValueKeepsHowManyEntriesAreItsOwn) {
+  Dictionary original;
+  original.reserve(2);
+  original.set("a", 1);
+  const Value value = original;
+  original.set("b", 2);
+  EXPECT_EQ(value, Value(Dictionary{{"a", 1}}));
+  EXPECT_EQ(value.dictionary().size(), 1U);
+  EXPECT_EQ(Value(original).dictionary().size(), 2U);
+}
+
+// A leak would be found by AddressSanitizer.
+TEST(DictionaryTest, AnOlderStateOfItselfIsNotPutIntoTheSameMemory) {
+  Dictionary dictionary;
+  dictionary.reserve(4);
+  dictionary.set("a", 1);
+  dictionary.set("self", dictionary);
+  dictionary.set("list", Array{dictionary});
+  EXPECT_EQ(dictionary.find("self")->dictionary(), (Dictionary{{"a", 1}}));
+  EXPECT_EQ(dictionary.find("list")->array()[0].dictionary().size(), 2U);
+}
+
+TEST(DictionaryTest, ManyHoldersUnderRandomChangesKeepTheirOwnContent) {
+  using Model = std::map<std::string, int>;
+  std::mt19937 random(5);  // the same values in every run
+  std::vector<std::pair<Dictionary, Model>> holders(8);
+  for (int round = 0; round < 20'000; ++round) {
+    auto& [dictionary, model] = holders[random() % holders.size()];
+    const std::string key = std::to_string(random() % 20);
+    switch (random() % 5) {
+      case 0:
+        holders[random() % holders.size()] = std::pair(dictionary, model);
+        break;
+      case 1:
+        ASSERT_EQ(dictionary.remove(key), model.erase(key) == 1);
+        break;
+      case 2:
+        dictionary.reserve(dictionary.size() + 4);
+        break;
+      default:
+        dictionary.set(key, round);
+        model[key] = round;
+    }
+    for (const auto& [held, expected] : holders) {
+      ASSERT_EQ(held.size(), expected.size());
+      for (const Dictionary::Entry& entry : held) {
+        ASSERT_EQ(entry.value, Value(expected.at(std::string(entry.key.text()))));
+      }
+    }
+  }
 }
 
 // --- Merging ------------------------------------------------------------------------------------

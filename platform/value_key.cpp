@@ -109,12 +109,12 @@ std::size_t Key::memorySize() const {
   return node_->interned ? 0 : sizeof(KeyNode) + node_->length;
 }
 
-bool operator==(const Key& left, const Key& right) {
-  if (left.node_ == right.node_) return true;
-  // Equal interned keys share a node. Two different nodes can hold equal texts only if at least one
-  // of them is not interned.
-  if (left.node_->interned && right.node_->interned) return false;
-  return left.node_->hash == right.node_->hash && left.text() == right.text();
+// Only for different nodes. Their texts differ if one of them is interned: a text is interned
+// either at all times or never, because the table only fills up. A full table has room for no later
+// text, and a text that has found its slots occupied finds them occupied for ever.
+bool Key::equalNodes(KeyNode& left, KeyNode& right) {
+  if (left.interned || right.interned) return false;
+  return left.hash == right.hash && left.view() == right.view();
 }
 
 }  // namespace halvox::platform

@@ -43,14 +43,15 @@ void stamp(platform::Message& message) {
   static const platform::Key timestamp("hvreporting_timestamp");
   static const platform::Key systemUptime("systemuptime_sec");
   static const platform::Key processUptime("processuptime_ms");
-  constexpr std::size_t kStamps = 3;
+  // The stamps, and the tag that a session adds.
+  constexpr std::size_t kAddedEntries = 4;
   if (!message.has_value()) return;
   const platform::ClockService& clock = platform::clock();
   for (const platform::Key& key : {timestamp, systemUptime, processUptime}) message->remove(key);
-  message->reserve(message->size() + kStamps);
-  message->set(timestamp, clock.currentDate().secondsSince1970);
-  message->set(systemUptime, roundedSeconds(clock.systemUptime()));
-  message->set(processUptime, std::int64_t{clock.processUptime().count()});
+  message->reserve(message->size() + kAddedEntries);
+  message->add(timestamp, clock.currentDate().secondsSince1970);
+  message->add(systemUptime, roundedSeconds(clock.systemUptime()));
+  message->add(processUptime, std::int64_t{clock.processUptime().count()});
 }
 
 }  // namespace
