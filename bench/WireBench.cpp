@@ -1,6 +1,7 @@
 // The cost of the single steps of reading a message from the wire and answering it.
 
 #include <algorithm>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -39,7 +40,7 @@ BENCHMARK(readHeader);
 void readAndDecodeTenFields(benchmark::State& state) {
   const std::string bytes = sendMessageFrame(state.range(0) == 1);
   std::vector<Value> arguments;
-  DecodeScratch scratch;
+  DecodeScratch scratch{.caches = std::make_unique<DecodeCaches>()};
   for (auto _ : state) {
     const auto result = readFrame(asBytes(bytes));
     const auto error = decodeBody(std::get<Frame>(result), "a{sv}uqaax", arguments, scratch);

@@ -96,6 +96,9 @@ struct InterfaceMethod {
   // small message could otherwise reach any number of sessions.
   std::size_t (*reporterIDs)(std::span<const Value> arguments) = nullptr;
   MethodAccess access = MethodAccess::kAnybody;
+  // The number of entries that the object adds to a dictionary among the arguments. The connection
+  // makes the dictionary with room for them: it then stays in one block of memory.
+  std::size_t addedEntries = 0;
 };
 
 // A protocol that objects export. Made of constants; lives as long as the process. The name of the

@@ -158,6 +158,9 @@ void invokeKillService(ExportedObject& object, Invocation&& request) {
   service(object).killService(boolReply(std::move(request.reply)));
 }
 
+// Three time stamps and the tag.
+constexpr std::size_t kEntriesAddedToMessage = 4;
+
 constexpr MethodEffect kMore = MethodEffect::kMayHoldMore;
 constexpr MethodEffect kNoMore = MethodEffect::kHoldsNoMore;
 
@@ -169,7 +172,8 @@ constexpr std::array kMethods{
     InterfaceMethod{"getServiceNameForReporterID", "x", "q", kNoMore, invokeGetServiceName},
     InterfaceMethod{"setConfiguration", "a{sv}x", "b", kMore, invokeSetConfiguration},
     InterfaceMethod{"startReportingSessionForID", "x", "b", kMore, invokeStart},
-    InterfaceMethod{"sendMessage", "a{sv}uqaax", "", kMore, invokeSendMessage, countReporterIDs},
+    InterfaceMethod{"sendMessage", "a{sv}uqaax", "", kMore, invokeSendMessage, countReporterIDs,
+                    MethodAccess::kAnybody, kEntriesAddedToMessage},
     InterfaceMethod{"stopReportingSessionForID", "x", "b", kNoMore, invokeStop},
     InterfaceMethod{"destroyReportingSession", "x", "b", kNoMore, invokeDestroy},
     InterfaceMethod{"reporterIDValid", "x", "a{sv}", kNoMore, invokeReporterIDValid},

@@ -4,6 +4,8 @@
 #include <array>
 #include <cstdint>
 #include <cstdlib>
+#include <memory>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
@@ -57,13 +59,26 @@ void checkError(const DecodeError& error) {
   require(error.message.find('\n') == std::string::npos);
 }
 
+// What earlier inputs left in the caches must not change the result.
+void checkCached(const Frame& frame, const std::optional<DecodeError>& expected,
+                 const std::vector<Value>& values) {
+  static DecodeScratch scratch{.caches = std::make_unique<DecodeCaches>()};
+  std::vector<Value> arguments;
+  const auto error = decodeBody(frame, frame.header.signature, arguments, scratch);
+  require(error.has_value() == expected.has_value());
+  require(!error.has_value() || error->message == expected->message);
+  require(arguments == values);
+}
+
 void decode(const Frame& frame) {
   std::vector<Value> arguments;
-  if (const auto error = decodeBody(frame, frame.header.signature, arguments)) {
+  const auto error = decodeBody(frame, frame.header.signature, arguments);
+  if (error.has_value()) {
     checkError(*error);
   } else {
     checkValues(frame, arguments);
   }
+  checkCached(frame, error, arguments);
 }
 
 void readWhole(std::span<const std::byte> bytes) {

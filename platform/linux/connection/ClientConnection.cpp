@@ -94,7 +94,8 @@ ClientConnection::Step ClientConnection::deliverFrame(const FrameBuffer::Next& n
     refuseOversized(next);
     return hasEnded() ? Step::kStop : Step::kGoOn;
   }
-  const std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(next.bytes);
+  const std::variant<dbus::Frame, dbus::WireError> read =
+      dbus::readFrame(next.bytes, host_.headers());
   if (const auto* error = std::get_if<dbus::WireError>(&read); error != nullptr) {
     onMalformed(error->message + " at byte " + std::to_string(error->offset));
     return Step::kStop;

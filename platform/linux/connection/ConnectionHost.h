@@ -18,6 +18,7 @@
 #include "platform/linux/connection/RequestDispatcher.h"
 #include "platform/linux/connection/SocketFile.h"
 #include "platform/linux/connection/TurnSchedule.h"
+#include "platform/linux/connection/wire/Frame.h"
 
 namespace halvox::platform::linux_ {
 
@@ -62,6 +63,8 @@ class ConnectionHost final : public NSXPCListener {
   [[nodiscard]] const ReadScratch& scratch() const { return scratch_; }
   [[nodiscard]] OutputBufferPool& outputBuffers() { return outputBuffers_; }
   [[nodiscard]] const std::shared_ptr<Inbox>& inbox() const { return inbox_; }
+  // The headers of requests. Their texts are valid until the next one is read.
+  [[nodiscard]] dbus::HeaderCache& headers() { return headers_; }
   [[nodiscard]] RequestDispatcher& dispatcher() { return *dispatcher_; }
   [[nodiscard]] ConnectionStatistics& statistics() { return *statistics_; }
   [[nodiscard]] const std::shared_ptr<ConnectionStatistics>& sharedStatistics() const {
@@ -102,6 +105,7 @@ class ConnectionHost final : public NSXPCListener {
   DeadlineQueue messages_;
   DeadlineQueue acceptRetries_;
   ReadScratch scratch_;
+  dbus::HeaderCache headers_;
   OutputBufferPool outputBuffers_;
   std::unique_ptr<RequestDispatcher> dispatcher_;
   TurnSchedule turn_;

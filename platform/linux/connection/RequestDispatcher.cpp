@@ -1,5 +1,6 @@
 #include "platform/linux/connection/RequestDispatcher.h"
 
+#include <memory>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -68,7 +69,9 @@ struct RequestDispatcher::Request {
 RequestDispatcher::RequestDispatcher(const ConnectionOptions& options,
                                      ConnectionStatistics& statistics,
                                      const ServiceIdentity& identity)
-    : options_(options), statistics_(statistics), standard_(identity) {}
+    : options_(options), statistics_(statistics), standard_(identity) {
+  scratch_.caches = std::make_unique<dbus::DecodeCaches>();
+}
 
 void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& frame,
                                  std::size_t frameBytes) {
@@ -100,6 +103,7 @@ void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& m
   // Check rights and limits before the body: a refused request then needs no decoding.
   if (method.access == MethodAccess::kOwner && isForbidden(request, method)) return;
   if (method.effect != MethodEffect::kHoldsNoMore && isOverLimits(request, method)) return;
+  scratch_.addedEntries = method.addedEntries;
   if (!decode(request, method.in)) return;
   // This is the only limit that depends on the arguments.
   if (namesTooManyReporters(request, method)) {
@@ -170,6 +174,7 @@ bool RequestDispatcher::namesTooManyReporters(const Request& request,
 }
 
 void RequestDispatcher::answerStandard(const Request& request, const StandardMethod& method) {
+  scratch_.addedEntries = 0;
   if (!decode(request, method.in)) return;
   statistics_.requestsAnsweredHere.add();
   const dbus::MessageHeader& header = request.header();

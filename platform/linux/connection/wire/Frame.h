@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <cstddef>
 #include <cstdint>
 #include <span>
@@ -89,5 +90,43 @@ struct FrameMeasure {
 // and padding. Checks and skips fields with unknown numbers. Accepts messages of unknown types.
 // After an error, the rest of the stream cannot be read. Allocates memory only for errors.
 [[nodiscard]] std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame);
+
+// The headers of frames that were read lately. The calls of a client differ in their serial number
+// only: a header whose fields are known need not be read again, which was a twelfth of the work for
+// a message. Belongs to one thread. Owned by the caller of readFrame().
+class HeaderCache {
+ public:
+  HeaderCache() = default;
+  HeaderCache(const HeaderCache&) = delete;
+  HeaderCache& operator=(const HeaderCache&) = delete;
+
+  // The header with these fields, without flags and serial number; null if it is not known. Its
+  // texts are valid until the next call of note().
+  [[nodiscard]] const MessageHeader* find(MessageType type, bool bigEndian,
+                                          std::span<const std::byte> fields) const;
+  // Keeps a header that was read from these fields without an error. Ignores long ones.
+  void note(const MessageHeader& header, std::span<const std::byte> fields);
+
+ private:
+  struct Slot {
+    std::string fields;
+    MessageHeader header;  // its texts point into the fields
+  };
+
+  static constexpr std::size_t kSlots = 16;
+  static constexpr std::size_t kMostBytes = 512;
+
+  // Different methods have names of different lengths.
+  [[nodiscard]] static std::size_t indexOf(std::span<const std::byte> fields) {
+    return fields.size() % kSlots;
+  }
+
+  std::array<Slot, kSlots> slots_;
+};
+
+// Does the same as the function above. The texts of the header are valid until the next call with
+// this cache.
+[[nodiscard]] std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame,
+                                                       HeaderCache& cache);
 
 }  // namespace halvox::platform::linux_::dbus

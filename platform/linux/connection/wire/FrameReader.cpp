@@ -1,5 +1,6 @@
 #include <array>
 #include <cstring>
+#include <optional>
 
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/linux/connection/wire/HeaderFields.h"
@@ -202,6 +203,45 @@ std::variant<Frame, WireError> finish(MessageHeader header, std::span<const std:
   return Frame{header, body};
 }
 
+// Reads the fields, or takes them from the cache, unless it is null.
+std::optional<WireError> readFields(std::span<const std::byte> fields, MessageHeader& header,
+                                    HeaderCache* cache) {
+  if (cache != nullptr) {
+    if (const MessageHeader* known = cache->find(header.type, header.bigEndian, fields)) {
+      const std::uint8_t flags = header.flags;
+      const std::uint32_t serial = header.serial;
+      header = *known;
+      header.flags = flags;
+      header.serial = serial;
+      return std::nullopt;
+    }
+  }
+  FieldReader reader(fields, header.bigEndian, header);
+  if (!reader.readAll()) return reader.error();
+  if (cache != nullptr) cache->note(header, fields);
+  return std::nullopt;
+}
+
+std::variant<Frame, WireError> readWhole(std::span<const std::byte> frame, HeaderCache* cache) {
+  const FrameMeasure measure = measureFrame(frame, kMaxMessageBytes);
+  if (measure.state == FrameMeasure::State::kBroken) return measure.error;
+  if (measure.state != FrameMeasure::State::kKnown || measure.totalBytes != frame.size()) {
+    return WireError{"the frame has another size than its header says", frame.size()};
+  }
+  MessageHeader header;
+  header.type = static_cast<MessageType>(byteAt(frame, kTypeOffset));
+  header.flags = byteAt(frame, kFlagsOffset);
+  header.bigEndian = byteAt(frame, 0) == 'B';
+  header.serial = numberAt(frame, kSerialOffset, header.bigEndian);
+  // D-Bus forbids it: in a reply, 0 would mean that the field is absent.
+  if (header.serial == 0) return WireError{"the serial number must not be 0", kSerialOffset};
+
+  const std::size_t fieldsBytes = numberAt(frame, kFieldsLengthOffset, header.bigEndian);
+  const auto fields = frame.subspan(kFrameStartBytes, fieldsBytes);
+  if (auto error = readFields(fields, header, cache)) return *std::move(error);
+  return finish(header, frame, kFrameStartBytes + fieldsBytes);
+}
+
 }  // namespace
 
 FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrameBytes) {
@@ -236,23 +276,31 @@ FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrame
 }
 
 std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame) {
-  const FrameMeasure measure = measureFrame(frame, kMaxMessageBytes);
-  if (measure.state == FrameMeasure::State::kBroken) return measure.error;
-  if (measure.state != FrameMeasure::State::kKnown || measure.totalBytes != frame.size()) {
-    return WireError{"the frame has another size than its header says", frame.size()};
-  }
-  MessageHeader header;
-  header.type = static_cast<MessageType>(byteAt(frame, kTypeOffset));
-  header.flags = byteAt(frame, kFlagsOffset);
-  header.bigEndian = byteAt(frame, 0) == 'B';
-  header.serial = numberAt(frame, kSerialOffset, header.bigEndian);
-  // D-Bus forbids it: in a reply, 0 would mean that the field is absent.
-  if (header.serial == 0) return WireError{"the serial number must not be 0", kSerialOffset};
+  return readWhole(frame, nullptr);
+}
 
-  const std::size_t fieldsBytes = numberAt(frame, kFieldsLengthOffset, header.bigEndian);
-  FieldReader fields(frame.subspan(kFrameStartBytes, fieldsBytes), header.bigEndian, header);
-  if (!fields.readAll()) return fields.error();
-  return finish(header, frame, kFrameStartBytes + fieldsBytes);
+std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame, HeaderCache& cache) {
+  return readWhole(frame, &cache);
+}
+
+const MessageHeader* HeaderCache::find(MessageType type, bool bigEndian,
+                                       std::span<const std::byte> fields) const {
+  const Slot& slot = slots_[indexOf(fields)];
+  const std::string_view text(reinterpret_cast<const char*>(fields.data()), fields.size());
+  const bool isSame =
+      slot.header.type == type && slot.header.bigEndian == bigEndian && slot.fields == text;
+  return isSame && !text.empty() ? &slot.header : nullptr;
+}
+
+void HeaderCache::note(const MessageHeader& header, std::span<const std::byte> fields) {
+  if (fields.size() > kMostBytes) return;
+  Slot& slot = slots_[indexOf(fields)];
+  slot.fields.assign(reinterpret_cast<const char*>(fields.data()), fields.size());
+  slot.header = header;
+  // The fields were read without an error a moment ago, and are read again at their new place.
+  MessageHeader& moved = slot.header;
+  static_cast<void>(
+      FieldReader(std::as_bytes(std::span(slot.fields)), header.bigEndian, moved).readAll());
 }
 
 }  // namespace halvox::platform::linux_::dbus

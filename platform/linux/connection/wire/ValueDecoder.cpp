@@ -28,6 +28,7 @@ class Decoder {
   [[nodiscard]] DecodeError error() const;
 
  private:
+  [[nodiscard]] bool takeKnownTail(const TailCache::Source& tail, std::vector<Value>& arguments);
   Value decode(std::string_view type, unsigned level);
   Value decodeContainer(std::string_view type, unsigned level);
   Value decodeBoolean(std::string_view type);
@@ -36,7 +37,12 @@ class Decoder {
   Value decodeData();
   Value decodeArray(std::string_view type, unsigned level);
   Value decodeDictionary(std::string_view type, unsigned level);
+  Dictionary takeEntries(std::size_t first, unsigned level);
   void decodeEntry(std::string_view type, unsigned level);
+  [[nodiscard]] bool decodeKnownEntry(unsigned level);
+  [[nodiscard]] bool usesKeyCache(std::string_view type, unsigned level) const {
+    return level == 1 && scratch_.caches != nullptr && type == "a{sv}" && reader_.isHostOrder();
+  }
 
   template <typename Number>
   Value decodeNumber(std::string_view type) {
@@ -63,6 +69,9 @@ class Decoder {
 
   WireReader reader_;
   DecodeScratch& scratch_;  // of the caller
+  // False if the dictionary that is being decoded may have a key twice. Only for dictionaries with
+  // known keys, which are arguments: they are never inside each other.
+  bool hasDistinctKeys_ = false;
   // Describes the error. `path_` is its place: each container adds its step while decoding leaves
   // it.
   bool failed_ = false;
@@ -73,7 +82,13 @@ class Decoder {
 };
 
 bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& arguments) {
+  std::optional<TailCache::Source> tail;
   for (std::string_view rest = types; !rest.empty();) {
+    // Only behind a dictionary: other requests are too small to gain from it.
+    if (scratch_.caches != nullptr && arguments.size() == 1 && arguments.front().isDictionary()) {
+      tail = {rest, reader_.rest(), reader_.position(), !reader_.isHostOrder()};
+      if (takeKnownTail(*tail, arguments)) return true;
+    }
     const std::string_view type = rest.substr(0, firstTypeLength(rest));
     arguments.push_back(decode(type, 0));
     if (failed_) {
@@ -86,8 +101,17 @@ bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& argume
   // nothing that was decoded can be trusted.
   if (!reader_.atLimit()) {
     refuse(Kind::kMalformed, "there are bytes after the last argument", types);
+  } else if (tail.has_value()) {
+    scratch_.caches->tails.note(*tail, arguments.data() + 1, arguments.data() + arguments.size());
   }
   return !failed_;
+}
+
+bool Decoder::takeKnownTail(const TailCache::Source& tail, std::vector<Value>& arguments) {
+  const std::vector<Value>* const known = scratch_.caches->tails.find(tail);
+  if (known == nullptr) return false;
+  arguments.insert(arguments.end(), known->begin(), known->end());
+  return true;
 }
 
 Value Decoder::decode(std::string_view type, unsigned level) {
@@ -199,36 +223,80 @@ Value Decoder::decodeDictionary(std::string_view type, unsigned level) {
   std::size_t outerLimit = 0;
   if (!reader_.enterArray(8, outerLimit)) return malformed(type);
   const std::size_t first = scratch_.entries.size();
-  while (!failed_ && !reader_.atLimit()) decodeEntry(type, level);
+  const bool usesKeyCache = this->usesKeyCache(type, level);
+  if (usesKeyCache) scratch_.caches->keys.beginDictionary();
+  if (level == 1) hasDistinctKeys_ = usesKeyCache;
+  while (!failed_ && !reader_.atLimit()) {
+    if (!usesKeyCache || !decodeKnownEntry(level)) decodeEntry(type, level);
+  }
   // decodeBody() clears the scratch after an error and after a success.
   if (failed_) return {};
   reader_.leaveArray(outerLimit);
+  return takeEntries(first, level);
+}
 
+Dictionary Decoder::takeEntries(std::size_t first, unsigned level) {
+  std::vector<Dictionary::Entry>& scratch = scratch_.entries;
+  const std::span<Dictionary::Entry> entries = std::span(scratch).subspan(first);
   Dictionary dictionary;
   // Too large if keys occur twice, which costs memory only.
-  dictionary.reserve(scratch_.entries.size() - first);
-  for (DecodeScratch::Entry& entry : std::span(scratch_.entries).subspan(first)) {
-    dictionary.set(entry.key, std::move(entry.value));
+  if (!entries.empty()) {
+    dictionary.reserve(entries.size() + (level == 1 ? scratch_.addedEntries : 0));
   }
-  scratch_.entries.erase(scratch_.entries.begin() + static_cast<std::ptrdiff_t>(first),
-                         scratch_.entries.end());
+  const bool areDistinct = level == 1 && hasDistinctKeys_;
+  for (Dictionary::Entry& entry : entries) {
+    if (areDistinct) {
+      dictionary.add(entry.key, std::move(entry.value));
+    } else {
+      dictionary.set(entry.key, std::move(entry.value));
+    }
+  }
+  scratch.erase(scratch.begin() + static_cast<std::ptrdiff_t>(first), scratch.end());
   return dictionary;
+}
+
+// Decodes an entry whose key and type were seen before. Returns false if they were not.
+bool Decoder::decodeKnownEntry(unsigned level) {
+  if (!reader_.align(8)) return false;  // decodeEntry() fails in the same way
+  const KeyCache::Head head = scratch_.caches->keys.find(reader_.rest());
+  if (head.key == nullptr) return false;
+  const std::string_view type = reader_.rest().substr(head.bytes - 2, 1);
+  if (head.isRepeated) hasDistinctKeys_ = false;
+  reader_.skip(head.bytes);
+  Value value = decode(type, level);
+  if (failed_) {
+    path_.putBefore(head.key->text());
+  } else {
+    scratch_.entries.push_back({*head.key, std::move(value)});
+  }
+  return true;
 }
 
 void Decoder::decodeEntry(std::string_view type, unsigned level) {
   // Of a{s…}, the part between the key's type and the closing brace.
   const std::string_view valueType = type.substr(3, type.size() - 4);
-  std::string_view key;
-  if (!reader_.align(8) || !reader_.readText(key)) {
+  std::string_view text;
+  if (!reader_.align(8)) {
+    malformed(type);
+    return;
+  }
+  const std::string_view head = reader_.rest();
+  if (!reader_.readText(text)) {
     malformed(type);
     return;
   }
   Value value = decode(valueType, level);
   if (failed_) {
-    path_.putBefore(key);
+    path_.putBefore(text);
     return;
   }
-  scratch_.entries.emplace_back(key, std::move(value));
+  const Key key(text);
+  if (usesKeyCache(type, level)) {
+    scratch_.caches->keys.note(head, key);
+    // The key may have been in the dictionary before, with a value that is not in the cache.
+    hasDistinctKeys_ = false;
+  }
+  scratch_.entries.push_back({key, std::move(value)});
 }
 
 DecodeError Decoder::error() const {

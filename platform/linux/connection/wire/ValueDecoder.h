@@ -1,13 +1,16 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
-#include <utility>
 #include <vector>
 
 #include "platform/linux/connection/wire/Frame.h"
+#include "platform/linux/connection/wire/KeyCache.h"
+#include "platform/linux/connection/wire/TailCache.h"
 #include "platform/value.h"
 
 namespace halvox::platform::linux_::dbus {
@@ -31,20 +34,27 @@ struct DecodeError {
   std::string message;
 };
 
-// The elements of containers that are being decoded, innermost last. Arrays and dictionaries are
-// made with their final size, which is known only after their last element. Without this scratch,
-// each container would be allocated twice. A caller that decodes many bodies keeps one scratch,
-// with its capacity, for all of them. Belongs to one thread. Empty between calls.
-struct DecodeScratch {
-  struct Entry {
-    Entry(std::string_view text, Value content) : key(text), value(std::move(content)) {}
-    Key key;
-    Value value;
-  };
-  std::vector<Value> values;
-  std::vector<Entry> entries;
+// What earlier bodies had. The result of decoding does not depend on it. Belongs to one thread.
+struct DecodeCaches {
+  KeyCache keys;
+  TailCache tails;
+};
 
-  // Gives memory back that only an unusually large message needed.
+// What decoding one body leaves for the next. A caller that decodes many bodies keeps one for all
+// of them. Belongs to one thread.
+struct DecodeScratch {
+  // The elements of containers that are being decoded, innermost last; empty between calls. Arrays
+  // and dictionaries are made with their final size, which is known only after their last element.
+  // Without these, each container would be allocated twice.
+  std::vector<Value> values{};
+  std::vector<Dictionary::Entry> entries{};
+  // For bodies that resemble each other. Null: each is decoded as if it were the first.
+  std::unique_ptr<DecodeCaches> caches{};
+  // How many entries the receiver adds to a dictionary that is an argument. The dictionary is made
+  // with room for them.
+  std::size_t addedEntries = 0;
+
+  // Empties the elements. Gives memory back that only an unusually large message needed.
   void clear();
 };
 

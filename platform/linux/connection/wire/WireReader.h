@@ -29,6 +29,12 @@ class WireReader {
   [[nodiscard]] bool atLimit() const { return position_ == limit_; }
   [[nodiscard]] std::string_view problem() const { return problem_; }
 
+  // True if the bytes are in the byte order of this machine.
+  [[nodiscard]] bool isHostOrder() const { return !swapped_; }
+  // What is left of the array or message, and how to pass over its front unread.
+  [[nodiscard]] std::string_view rest() const { return {bytes_ + position_, limit_ - position_}; }
+  void skip(std::size_t bytes) { position_ += bytes; }
+
   // Notes the problem, and returns false.
   bool fail(std::string_view problem) {
     problem_ = problem;

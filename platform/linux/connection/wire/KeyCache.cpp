@@ -1,0 +1,71 @@
+#include "platform/linux/connection/wire/KeyCache.h"
+
+#include <cstring>
+
+namespace halvox::platform::linux_::dbus {
+namespace {
+
+constexpr std::size_t kLengthBytes = 4;
+// Behind the text: a NUL, the length of the signature, its one character and another NUL.
+constexpr std::size_t kTailBytes = 4;
+constexpr std::string_view kBasicTypes = "ynqiuxtdbsog";
+
+template <typename Word>
+Word wordAt(const char* bytes) {
+  Word word;
+  std::memcpy(&word, bytes, sizeof word);
+  return word;
+}
+
+// Mixes the first and the last characters. Keys often differ in the last one only.
+std::uint64_t mixed(std::string_view text) {
+  constexpr std::uint64_t kFactor = 0x9e3779b97f4a7c15U;
+  const char* const begin = text.data();
+  const char* const end = begin + text.size();
+  std::uint64_t first = text.size();
+  std::uint64_t last = 0;
+  if (text.size() >= 8) {
+    first += wordAt<std::uint64_t>(begin);
+    last = wordAt<std::uint64_t>(end - 8);
+  } else if (text.size() >= 4) {
+    first += wordAt<std::uint32_t>(begin);
+    last = wordAt<std::uint32_t>(end - 4);
+  } else {
+    for (const char character : text) first = first * 31 + static_cast<unsigned char>(character);
+  }
+  return (first ^ (last * kFactor)) * kFactor;
+}
+
+}  // namespace
+
+KeyCache::Slot& KeyCache::slotOf(std::string_view text) {
+  static_assert(kSlots == 256, "the index below is a byte");
+  return slots_[mixed(text) >> 56U];
+}
+
+KeyCache::Head KeyCache::find(std::string_view bytes) {
+  if (bytes.size() < kLengthBytes + kTailBytes) return {};
+  const std::size_t length = wordAt<std::uint32_t>(bytes.data());
+  if (length > bytes.size() - kLengthBytes - kTailBytes) return {};
+  const std::string_view text = bytes.substr(kLengthBytes, length);
+  Slot& slot = slotOf(text);
+  // The tail of a free slot is 0, which is not that of any entry.
+  if (wordAt<std::uint32_t>(text.data() + length) != slot.tail || text != slot.text) return {};
+  const bool isRepeated = slot.dictionary == dictionary_;
+  slot.dictionary = dictionary_;
+  return {&*slot.key, kLengthBytes + length + kTailBytes, isRepeated};
+}
+
+void KeyCache::note(std::string_view bytes, const Key& key) {
+  if (!key.isInterned()) return;
+  const std::string_view text = key.text();
+  const std::string_view tail = bytes.substr(kLengthBytes + text.size(), kTailBytes);
+  if (tail[1] != 1 || kBasicTypes.find(tail[2]) == std::string_view::npos) return;
+  Slot& slot = slotOf(text);
+  slot.key = key;
+  slot.text = text;
+  slot.tail = wordAt<std::uint32_t>(tail.data());
+  slot.dictionary = dictionary_;
+}
+
+}  // namespace halvox::platform::linux_::dbus

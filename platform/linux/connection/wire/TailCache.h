@@ -1,0 +1,53 @@
+#pragma once
+
+#include <array>
+#include <cstddef>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/value.h"
+
+namespace halvox::platform::linux_::dbus {
+
+// The arguments behind the first one, as some messages had them lately.
+//
+// The messages of a session name the same category, type and reporter IDs most of the time. Equal
+// bytes decode to equal values, which are immutable: they are shared instead of decoded. The lists
+// of reporter IDs were two allocations a message. Belongs to one thread. Owned by the caller of the
+// decoder.
+class TailCache {
+ public:
+  // Longer arguments are decoded.
+  static constexpr std::size_t kMostBytes = 64;
+
+  // What the values of arguments depend on.
+  struct Source {
+    std::string_view types;
+    std::string_view bytes;  // up to the end of the message
+    std::size_t position;    // of the first byte in the message: alignment depends on it
+    bool bigEndian;
+  };
+
+  // The values, or null. Valid until the next call of note().
+  [[nodiscard]] const std::vector<Value>* find(const Source& source) const;
+  // Keeps the values that were decoded from it.
+  void note(const Source& source, const Value* begin, const Value* end);
+
+ private:
+  struct Slot {
+    std::string types;
+    std::string bytes;
+    std::size_t alignment = 0;
+    bool bigEndian = false;
+    std::vector<Value> values;
+  };
+
+  static constexpr std::size_t kSlots = 16;
+
+  [[nodiscard]] static std::size_t indexOf(std::string_view bytes);
+
+  std::array<Slot, kSlots> slots_;
+};
+
+}  // namespace halvox::platform::linux_::dbus
