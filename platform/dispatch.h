@@ -58,8 +58,33 @@ class DispatchQueue {
   virtual void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
                       std::optional<std::chrono::nanoseconds> timeout,
                       std::function<void(WaitOutcome)> then) = 0;
+  // Begins a job of the calling thread at once, if the queue runs none, has none and waits for
+  // nothing: the thread then does the work as a job of this queue, and calls leave(). The work must
+  // be brief and must not call waitOn(). Returns false if that is not possible; the caller then
+  // adds a job. A queue may always decline. Use QueueEntry.
+  [[nodiscard]] virtual bool tryEnter() { return false; }
+  virtual void leave() {}
   // True on the thread that is running a job of this queue at the moment. For assertions.
   [[nodiscard]] virtual bool isCurrent() const = 0;
+};
+
+// Brief work that the calling thread does in a queue without adding a job, while this object
+// exists. Work of which there is much costs neither an allocation nor a change of threads then.
+class QueueEntry {
+ public:
+  // `queue` must outlive this.
+  explicit QueueEntry(DispatchQueue& queue) : queue_(queue), isInside_(queue.tryEnter()) {}
+  QueueEntry(const QueueEntry&) = delete;
+  QueueEntry& operator=(const QueueEntry&) = delete;
+  ~QueueEntry() {
+    if (isInside_) queue_.leave();
+  }
+  // False if the queue declined.
+  explicit operator bool() const { return isInside_; }
+
+ private:
+  DispatchQueue& queue_;
+  const bool isInside_;
 };
 
 // Queues, delays and the background pool of the platform.

@@ -144,13 +144,17 @@ void HVReportingSession::sendMessage(const Message& message, AudioEventCategory 
   // stopped or started again. Read after the message was recorded; this order is required.
   const bool wasStarted = started();
   if (tlmReportingEnabled()) {
-    link_.submit(shared_from_this(), {.original = message,
-                                      .tagged = tagged,
-                                      .category = category,
-                                      .type = type,
-                                      .wasStarted = wasStarted,
-                                      .isRedundant = outcome == SessionHistory::Outcome::kRedundant,
-                                      .sender = sender != nullptr ? sender : held_.account()});
+    LinkMessage linkMessage{.original = message,
+                            .tagged = tagged,
+                            .category = category,
+                            .type = type,
+                            .wasStarted = wasStarted,
+                            .isRedundant = outcome == SessionHistory::Outcome::kRedundant,
+                            .sender = sender != nullptr ? sender : held_.account()};
+    // A sender who waits for the reply gets it before the link has done anything.
+    if (reply || !link_.trySend(linkMessage)) {
+      link_.submit(shared_from_this(), std::move(linkMessage));
+    }
   }
   // The sender does not wait for the link and never hears of its failures.
   if (reply) reply(std::nullopt);

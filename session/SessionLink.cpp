@@ -170,6 +170,16 @@ void SessionLink::submit(const Owner& owner, LinkMessage message) {
       [this, owner, message = std::move(message), charge = std::move(charge)] { handle(message); });
 }
 
+bool SessionLink::trySend(const LinkMessage& message) {
+  // Single messages are delayed anyway.
+  if (!message.wasStarted || !platform::tlmReporting().onlyNotesMessages()) return false;
+  const platform::QueueEntry entry(*tlmReportingQueue());
+  if (!entry) return false;
+  counters_.link.received.add();
+  handle(message);
+  return true;
+}
+
 void SessionLink::handle(const LinkMessage& message) {
   kSessionLog.debug(
       "entering tlmreporting "

@@ -37,6 +37,83 @@ TEST_F(SessionLinkMessagesTest, MessagesThatWaitedAreSentInOrder) {
                                       Dictionary{{"a", 3}, {"audiotag", "PlaybackStart"}}));
 }
 
+// A framework that only notes messages, and queues that threads may enter: those of the service in
+// its default configuration.
+class SessionLinkAtOnceTest : public LinkFixture {
+ protected:
+  SessionLinkAtOnceTest() {
+    platform_.dispatch.letThreadsEnter();
+    framework_.setOnlyNotesMessages(true);
+  }
+};
+
+TEST_F(SessionLinkAtOnceTest, AMessageOfAnIdleLinkNeedsNoJob) {
+  open();
+
+  send({{"a", 1}});
+
+  EXPECT_THAT(payloads(), ElementsAre(Dictionary{{"a", 1}, {"audiotag", "PlaybackStart"}}));
+  EXPECT_EQ(platform_.dispatch.waitingJobs(), 0U);
+  EXPECT_EQ(platform_.statistics.value("link", "sent"), 1U);
+}
+
+TEST_F(SessionLinkAtOnceTest, AMessageWithoutBackEndsIsDroppedWithoutAJob) {
+  framework_.answerDiscoveries(Fake::Answering::kLater, std::nullopt);
+  start();
+
+  send({{"a", 1}});
+
+  EXPECT_EQ(platform_.dispatch.waitingJobs(), 0U);
+  EXPECT_EQ(platform_.statistics.value("link", "dropped: no back-end"), 1U);
+}
+
+TEST_F(SessionLinkAtOnceTest, MessagesComeAfterThoseThatWait) {
+  holdDiscoveries();
+  start();
+  send({{"a", 1}});
+  run();
+  framework_.answerDiscovery(kServers);
+  send({{"a", 2}});
+  EXPECT_THAT(framework_.messages(), IsEmpty());
+
+  run();
+  send({{"a", 3}});
+
+  EXPECT_THAT(payloads(), ElementsAre(Dictionary{{"a", 1}, {"audiotag", "PlaybackStart"}},
+                                      Dictionary{{"a", 2}, {"audiotag", "PlaybackStart"}},
+                                      Dictionary{{"a", 3}, {"audiotag", "PlaybackStart"}}));
+}
+
+TEST_F(SessionLinkAtOnceTest, TheReplyComesBeforeTheFrameworkHasTheMessage) {
+  open();
+  std::vector<std::size_t> sentBefore;
+
+  session_->sendMessage(Dictionary{{"a", 1}}, kPlayback, kStart, [&](const auto& /*error*/) {
+    sentBefore.push_back(framework_.messages().size());
+  });
+  run();
+
+  EXPECT_THAT(sentBefore, ElementsAre(0U));
+  EXPECT_EQ(framework_.messages().size(), 1U);
+}
+
+TEST_F(SessionLinkAtOnceTest, AFrameworkThatDoesMoreThanNoteMessagesGetsThemFromAJob) {
+  framework_.setOnlyNotesMessages(false);
+  open();
+
+  send({{"a", 1}});
+
+  EXPECT_THAT(framework_.messages(), IsEmpty());
+  run();
+  EXPECT_EQ(framework_.messages().size(), 1U);
+}
+
+TEST_F(SessionLinkAtOnceTest, AMessageOutsideARunIsASingleMessage) {
+  send({{"a", 1}});
+  platform_.dispatch.advance(1s);
+  EXPECT_EQ(framework_.singleMessages().size(), 1U);
+}
+
 TEST_F(SessionLinkMessagesTest, MessagesThatWaitedInVainAreDroppedWithoutALine) {
   holdDiscoveries();
   start();

@@ -52,6 +52,14 @@ void FakeDispatchQueue::async(JobWeight weight, Job job) {
   service_.add(shared_from_this(), weight, std::move(job));
 }
 
+bool FakeDispatchQueue::tryEnter() {
+  if (!service_.mayEnter(*this)) return false;
+  outerQueue_ = std::exchange(runningQueue, this);
+  return true;
+}
+
+void FakeDispatchQueue::leave() { runningQueue = outerQueue_; }
+
 bool FakeDispatchQueue::isCurrent() const { return runningQueue == this; }
 
 void FakeDispatchQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
@@ -176,6 +184,14 @@ void FakeDispatchService::clear() {
     waiting.swap(waiting_);
     delayed.swap(delayed_);
   }
+}
+
+bool FakeDispatchService::mayEnter(const FakeDispatchQueue& queue) const {
+  const std::lock_guard lock(mutex_);
+  const bool isShared = queue.traits().threading == QueueThreading::kShared;
+  if (!letsThreadsEnter_ || !isShared || queue.isWaiting_ || queue.isCurrent()) return false;
+  return std::ranges::none_of(
+      waiting_, [&queue](const Waiting& waiting) { return waiting.queue.get() == &queue; });
 }
 
 std::size_t FakeDispatchService::waitingJobs() const {

@@ -42,6 +42,9 @@ class FakeDispatchQueue final : public DispatchQueue,
   void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
               std::optional<std::chrono::nanoseconds> timeout,
               std::function<void(WaitOutcome)> then) override;
+  // Declines unless the test has allowed it. See FakeDispatchService::letThreadsEnter().
+  [[nodiscard]] bool tryEnter() override;
+  void leave() override;
   [[nodiscard]] bool isCurrent() const override;
 
  private:
@@ -49,7 +52,8 @@ class FakeDispatchQueue final : public DispatchQueue,
 
   FakeDispatchService& service_;
   const Traits traits_;
-  bool isWaiting_ = false;  // guarded by the service's mutex
+  FakeDispatchQueue* outerQueue_ = nullptr;  // of the thread that has entered
+  bool isWaiting_ = false;                   // guarded by the service's mutex
 };
 
 // A semaphore of the fake service, which it must not outlive.
@@ -98,6 +102,10 @@ class FakeDispatchService final : public DispatchService {
   // destructor of a job adds a job, that is dropped too.
   void clear();
 
+  // From now on a thread may enter a shared queue that is idle. By default all queues decline,
+  // which is allowed, and every job waits until the test runs it.
+  void letThreadsEnter() { letsThreadsEnter_ = true; }
+
   [[nodiscard]] std::size_t waitingJobs() const;
   [[nodiscard]] std::size_t delayedJobs() const;
   [[nodiscard]] std::size_t waitingQueues() const;
@@ -137,6 +145,7 @@ class FakeDispatchService final : public DispatchService {
   // The caller holds the mutex.
   void addSignal(FakeDispatchSemaphore& semaphore);
   [[nodiscard]] bool tryTakeSignal(FakeDispatchSemaphore& semaphore);
+  [[nodiscard]] bool mayEnter(const FakeDispatchQueue& queue) const;
   void setWaiting(FakeDispatchQueue* queue, bool isWaiting);
   // The caller holds the mutex. Lets the queue continue with `then`, ahead of its other jobs.
   void endWait(Wait wait, WaitOutcome outcome);
@@ -146,6 +155,7 @@ class FakeDispatchService final : public DispatchService {
   void moveTimeTo(std::chrono::nanoseconds time);
 
   FakeClockService& clock_;
+  bool letsThreadsEnter_ = false;
   mutable std::mutex mutex_;
   std::deque<Waiting> waiting_;
   Waits waits_;  // in the order in which they began

@@ -76,6 +76,9 @@ class FakeTlmReportingService final : public TLMReportingService {
   Session TLMReportingCreateSession(const Dictionary& sessionInfo,
                                     const Dictionary& userInfo) override;
   void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) override;
+  // Sets whether sends count as cheap. By default they do not.
+  void setOnlyNotesMessages(bool onlyNotes) { onlyNotesMessages_ = onlyNotes; }
+  [[nodiscard]] bool onlyNotesMessages() const override { return onlyNotesMessages_; }
   TLMReportingOutcome TLMReportingSendMessage(const Session& session,
                                               const TLMReportingMessage& message) override;
   void TLMReportingFlushMessages(const Session& session, std::function<void()> flushed) override;
@@ -94,6 +97,7 @@ class FakeTlmReportingService final : public TLMReportingService {
   std::optional<Array> backends_;
   TLMReportingOutcome outcome_{.sent = true};
   std::vector<std::string> tokens_;
+  bool onlyNotesMessages_ = false;
   std::vector<Info> infos_;
   std::vector<std::weak_ptr<TLMReportingSession>> sessions_;
   std::deque<BackendsCallback> waitingDiscoveries_;

@@ -45,6 +45,37 @@ void SharedQueue::async(JobWeight /*weight*/, Job job) {
   askForTurn();
 }
 
+bool SharedQueue::tryEnter() {
+  if (pool_->isStopped()) return false;
+  {
+    const MutexLock lock(mutex_);
+    // A turn that is asked for or runs has jobs before this one.
+    if (hasTurn_ || isWaiting_) return false;
+    hasTurn_ = true;
+    pool_->beginTurn();
+  }
+  label_.added.add();
+  label_.atWork.fetch_add(1, std::memory_order_relaxed);
+  entered_.emplace(this, label_.text);
+  return true;
+}
+
+void SharedQueue::leave() {
+  entered_.reset();
+  label_.atWork.fetch_sub(1, std::memory_order_relaxed);
+  label_.run.add();
+  {
+    const MutexLock lock(mutex_);
+    if (jobs_.empty()) {
+      hasTurn_ = false;
+      pool_->endTurn();
+      return;
+    }
+  }
+  // Jobs that were added meanwhile have found a turn and did not ask for one.
+  askForTurn();
+}
+
 void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
                          std::optional<std::chrono::nanoseconds> timeout,
                          std::function<void(WaitOutcome)> then) {
@@ -52,6 +83,7 @@ void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
   auto shared = std::dynamic_pointer_cast<SharedSemaphore>(std::move(semaphore));
   if (shared == nullptr)
     throw std::logic_error("waitOn() needs a semaphore of its queue's service");
+  if (entered_.has_value()) throw std::logic_error("waitOn() was called without a job");
   {
     const MutexLock lock(mutex_);
     if (isWaiting_) throw std::logic_error("a job called waitOn() a second time");

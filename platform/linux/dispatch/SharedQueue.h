@@ -25,6 +25,8 @@ class DispatchPool;
 //                        v    |
 //                       waiting
 //
+// A thread that enters an idle queue has a turn too, on that thread and without the pool.
+//
 // A turn is one entry in the pool's run queue, however many jobs the queue has. At most one turn
 // exists at a time, which is what makes the queue serial.
 // Shared by its holders, its turn and its wait. Any thread may add jobs. The number of jobs has no
@@ -41,6 +43,8 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
   void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
               std::optional<std::chrono::nanoseconds> timeout,
               std::function<void(WaitOutcome)> then) override;
+  [[nodiscard]] bool tryEnter() override;
+  void leave() override;
   [[nodiscard]] bool isCurrent() const override { return DispatchThread::current().worksFor(this); }
 
   // Ends the wait: the queue continues with this job, then with those that were added meanwhile.
@@ -65,6 +69,8 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
   std::deque<Job> jobs_ HALVOX_GUARDED_BY(mutex_);
   bool hasTurn_ HALVOX_GUARDED_BY(mutex_) = false;  // a turn is noted, queued or running
   bool isWaiting_ HALVOX_GUARDED_BY(mutex_) = false;
+  // The thread that has entered. Only it touches this, and only while it has the turn.
+  std::optional<DispatchThread::Working> entered_;
 };
 
 }  // namespace halvox::platform::linux_
