@@ -7,6 +7,7 @@
 #include <span>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "platform/process.h"
@@ -46,6 +47,9 @@ struct ResourceUse {
 class ExportedObject {
  public:
   virtual ~ExportedObject() = default;
+  // The requests that were posted lately are all that have arrived. Called on the connection's
+  // thread after each series of InterfaceMethod::post.
+  virtual void endOfRequests() {}
   // What the service holds for this client now. Called on the connection's thread; never blocks.
   [[nodiscard]] virtual ResourceUse resourceUse() const { return {}; }
 };
@@ -68,6 +72,57 @@ struct Invocation {
   std::span<const Value> arguments;
   ReplyCallback reply;  // never empty; does nothing if the client wants no answer
   RequestContext context;
+};
+
+// What an open request is to the connection that has read it.
+struct RequestMark {
+  std::uint32_t serial = 0;
+  bool wantsAnswer = false;
+  std::string_view signature{};  // of the answer; a constant
+  std::size_t weight = 1;        // how many requests it counts as
+  std::size_t bytes = 0;
+};
+
+// The connection's part that outlives it. Shared by the connection and its open requests. Any
+// thread may call.
+class RequestSource {
+ public:
+  virtual ~RequestSource() = default;
+  // Answers the request, like a ReplyCallback.
+  virtual void answer(const RequestMark& mark, const std::optional<Error>& error,
+                      const Value& value) = 0;
+  // The request has been carried out, like the end of a RequestToken.
+  virtual void carriedOut(const RequestMark& mark) = 0;
+};
+
+// A ReplyCallback and a RequestToken in one, for the requests of which there are most: it needs no
+// allocation. The request counts as open as long as this exists. Belongs to one thread at a time.
+class PostedRequest {
+ public:
+  PostedRequest() = default;
+  PostedRequest(std::shared_ptr<RequestSource> source, const RequestMark& mark)
+      : source_(std::move(source)), mark_(mark) {}
+  PostedRequest(PostedRequest&&) noexcept = default;
+  PostedRequest& operator=(PostedRequest&& other) noexcept {
+    PostedRequest taken(std::move(other));
+    std::swap(source_, taken.source_);
+    std::swap(mark_, taken.mark_);
+    return *this;
+  }
+  PostedRequest(const PostedRequest&) = delete;
+  PostedRequest& operator=(const PostedRequest&) = delete;
+  ~PostedRequest() {
+    if (source_ != nullptr) source_->carriedOut(mark_);
+  }
+
+  // Call it at most once. Does nothing if the client wants no answer.
+  void answer(const std::optional<Error>& error, const Value& value) const {
+    if (source_ != nullptr && mark_.wantsAnswer) source_->answer(mark_, error, value);
+  }
+
+ private:
+  std::shared_ptr<RequestSource> source_;
+  RequestMark mark_;
 };
 
 // Whether a request can make the service hold more for its client. While a client is over its limit
@@ -99,6 +154,11 @@ struct InterfaceMethod {
   // The number of entries that the object adds to a dictionary among the arguments. The connection
   // makes the dictionary with room for them: it then stays in one block of memory.
   std::size_t addedEntries = 0;
+  // If it is not null, it is called instead of `invoke`. It may keep the request until
+  // ExportedObject::endOfRequests(), or until another method of the object is called: a series of
+  // requests can then be carried out by one job. `arguments` are valid until it returns.
+  void (*post)(ExportedObject& object, std::span<const Value> arguments, PostedRequest&& request,
+               ProcessID sender) = nullptr;
 };
 
 // A protocol that objects export. Made of constants; lives as long as the process. The name of the

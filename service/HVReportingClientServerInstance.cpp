@@ -1,5 +1,6 @@
 #include "service/HVReportingClientServerInstance.h"
 
+#include <exception>
 #include <utility>
 
 #include "backends/HVReportingUtility.h"
@@ -12,6 +13,9 @@ namespace halvox {
 namespace {
 
 constexpr int kKilledExitStatus = 2;
+// Enough for the requests that wait while a stop takes its time, and for all of one read.
+constexpr std::size_t kMostSpares = 4;
+constexpr std::size_t kMostSpareMessages = 128;
 
 // The name of the process that sent a message; none if the process has ended. The name is looked up
 // for each message, because a process may rename itself at any time. A look-up reads a file, which
@@ -21,6 +25,23 @@ std::optional<std::string> senderProcessName(AudioEventType type, platform::Proc
   if (!HVReportingUtilityIsInternalBuild()) return std::nullopt;
   return HVReportingUtilityProcessNameForPID(sender);
 }
+
+// A request that came with a reply and a token of its own.
+class CallbackSource final : public platform::RequestSource {
+ public:
+  CallbackSource(ErrorReply reply, platform::RequestToken token)
+      : reply_(std::move(reply)), token_(std::move(token)) {}
+
+  void answer(const platform::RequestMark& /*mark*/, const std::optional<platform::Error>& error,
+              const platform::Value& /*value*/) override {
+    reply_(error);
+  }
+  void carriedOut(const platform::RequestMark& /*mark*/) override { token_.reset(); }
+
+ private:
+  const ErrorReply reply_;
+  platform::RequestToken token_;
+};
 
 }  // namespace
 
@@ -68,6 +89,8 @@ HVReportingClientServerInstance::Session HVReportingClientServerInstance::findRe
 template <typename Work>
 void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
                                                    RequestContext&& context, Work work) {
+  // Requests are carried out in the order of their arrival.
+  endOfRequests();
   counters_->requests.received.add();
   reportingQueue()->async(weight, [client = shared_from_this(), token = std::move(context.token),
                                    work = std::move(work)]() mutable {
@@ -133,14 +156,79 @@ void HVReportingClientServerInstance::sendMessage(platform::Message message,
                                                   AudioEventCategory category, AudioEventType type,
                                                   ReporterIDs reporterIDs, ErrorReply reply,
                                                   RequestContext context) {
+  std::optional<platform::Array> reporters;
+  if (reporterIDs.has_value()) {
+    std::vector<platform::Value> numbers;
+    for (const ReporterID reporterID : *reporterIDs) {
+      numbers.emplace_back(static_cast<std::int64_t>(reporterID));
+    }
+    reporters = platform::Array(numbers);
+  }
+  auto source = std::make_shared<CallbackSource>(std::move(reply), std::move(context.token));
+  postMessage(std::move(message), category, type, std::move(reporters),
+              platform::PostedRequest(std::move(source), {.wantsAnswer = true}), context.sender);
+  endOfRequests();
+}
+
+void HVReportingClientServerInstance::postMessage(platform::Message message,
+                                                  AudioEventCategory category, AudioEventType type,
+                                                  std::optional<platform::Array> reporterIDs,
+                                                  platform::PostedRequest request,
+                                                  platform::ProcessID sender) {
+  counters_->requests.received.add();
+  if (posted_.capacity() == 0) {
+    const auto spares = spareMessages().lock();
+    if (!spares->empty()) {
+      posted_ = std::move(spares->back());
+      spares->pop_back();
+    }
+  }
   ResourceCharge charge(account_, message ? message->memorySize() : 0);
   // Looked up here, on the connection's thread: when the job runs, the sender may have ended.
-  auto senderName = senderProcessName(type, context.sender);
-  queueRequest(
-      platform::JobWeight::kBrief, std::move(context),
-      [request = MessageRequest{std::move(message), category, type, std::move(reporterIDs),
-                                std::move(senderName), std::move(reply), std::move(charge)}](
-          auto& client) mutable { client.carryOutSend(request); });
+  posted_.push_back({std::move(message), category, type, std::move(reporterIDs),
+                     senderProcessName(type, sender), std::move(request), std::move(charge)});
+}
+
+// One job for all messages that one read of the socket gave. A job for each, with its token and its
+// reply, were six allocations a message.
+void HVReportingClientServerInstance::endOfRequests() {
+  if (posted_.empty()) return;
+  reportingQueue()->async(platform::JobWeight::kBrief,
+                          [client = shared_from_this(),
+                           messages = std::make_shared<Messages>(std::exchange(posted_, {}))] {
+                            client->carryOutSends(*messages);
+                          });
+}
+
+void HVReportingClientServerInstance::carryOutSends(Messages& messages) {
+  std::exception_ptr failure;
+  for (MessageRequest& message : messages) {
+    // Releases each message as soon as it has been sent: the client's next requests are read only
+    // while few are open.
+    MessageRequest request = std::move(message);
+    try {
+      carryOutSend(request);
+      counters_->requests.carriedOut.add();
+    } catch (...) {
+      // The queue logs it. It must not cost the other messages.
+      failure = std::current_exception();
+    }
+  }
+  messages.clear();
+  {
+    const auto spares = spareMessages().lock();
+    if (spares->size() < kMostSpares && messages.capacity() <= kMostSpareMessages) {
+      spares->push_back(std::move(messages));
+    }
+  }
+  if (failure) std::rethrow_exception(failure);
+}
+
+Guarded<std::vector<HVReportingClientServerInstance::Messages>>&
+HVReportingClientServerInstance::spareMessages() {
+  // Never destroyed: connections may still have work while the process exits.
+  static auto* const spares = new Guarded<std::vector<Messages>>;
+  return *spares;
 }
 
 void HVReportingClientServerInstance::stopReportingSessionForID(ReporterID reporterID,

@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 #include <unordered_map>
+#include <vector>
 
 #include "platform/dispatch.h"
 #include "platform/process.h"
@@ -74,6 +75,10 @@ class HVReportingClientServerInstance final
                                   RequestContext context) override;
   void sendMessage(platform::Message message, AudioEventCategory category, AudioEventType type,
                    ReporterIDs reporterIDs, ErrorReply reply, RequestContext context) override;
+  void postMessage(platform::Message message, AudioEventCategory category, AudioEventType type,
+                   std::optional<platform::Array> reporterIDs, platform::PostedRequest request,
+                   platform::ProcessID sender) override;
+  void endOfRequests() override;
   void stopReportingSessionForID(ReporterID reporterID, BoolReply reply,
                                  RequestContext context) override;
   void destroyReportingSession(ReporterID reporterID, BoolReply reply,
@@ -92,11 +97,16 @@ class HVReportingClientServerInstance final
     platform::Message message;
     AudioEventCategory category;
     AudioEventType type;
-    ReporterIDs reporterIDs;
+    std::optional<platform::Array> reporterIDs;
     std::optional<std::string> senderProcessName;  // none: unknown or not needed
-    ErrorReply reply;
+    platform::PostedRequest request;
     ResourceCharge charge;  // for the message, until the request has been carried out
   };
+  // Messages that one job sends.
+  using Messages = std::vector<MessageRequest>;
+  // Empty ones with room, for any client. They belong to the process: a client that has sent much
+  // once must not hold memory for it.
+  static Guarded<std::vector<Messages>>& spareMessages();
 
   // Queues `work`, which is called with this client, on the reporting queue. Keeps the client and
   // the request's token until then.
@@ -116,6 +126,7 @@ class HVReportingClientServerInstance final
                                 const BoolReply& reply);
   void carryOutStart(ReporterID reporterID, const BoolReply& reply);
   void carryOutSend(MessageRequest& request);
+  void carryOutSends(Messages& messages);
   void carryOutStop(ReporterID reporterID, const BoolReply& reply);
   void carryOutDestroy(ReporterID reporterID, const BoolReply& reply);
   void carryOutReporterIDValid(ReporterID reporterID, const DictionaryReply& reply) const;
@@ -148,6 +159,7 @@ class HVReportingClientServerInstance final
   Guarded<std::optional<platform::Date>> clientStartDate_;
   Guarded<std::optional<std::string>> clientProcessName_;
   SessionMap sessions_;  // reporting queue only
+  Messages posted_;      // connection's thread only; not queued yet
 };
 
 }  // namespace halvox

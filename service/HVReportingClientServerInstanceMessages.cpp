@@ -21,19 +21,19 @@ constexpr ReporterID kStandaloneReporterID{1};
 // Describes the reporter IDs of a request for a log line.
 class ReporterIDsDescription {
  public:
-  explicit ReporterIDsDescription(const HVReportingServiceProtocol::ReporterIDs& reporters)
+  explicit ReporterIDsDescription(const std::optional<platform::Array>& reporters)
       : reporters_(reporters) {}
   [[nodiscard]] std::string description() const {
     if (!reporters_.has_value()) return "(null)";
     return ListDescription(*reporters_,
-                           [](std::string& text, ReporterID reporterID) {
-                             text += std::to_string(number(reporterID));
+                           [](std::string& text, const platform::Value& reporterID) {
+                             text += std::to_string(reporterID.toInt64());
                            })
         .description();
   }
 
  private:
-  const HVReportingServiceProtocol::ReporterIDs& reporters_;  // owned by the request
+  const std::optional<platform::Array>& reporters_;  // owned by the request
 };
 
 // Adds the time of arrival to the message. Removes what the client sent under these keys first, so
@@ -63,7 +63,8 @@ void HVReportingClientServerInstance::carryOutSend(MessageRequest& request) {
   const Delegate delegate = delegate_.lock();
   if (delegate == nullptr || !delegate->isReportingEnabled()) {
     counters_->messages.disabled.add();
-    request.reply(platform::Error{.domain = std::string(kErrorDomain), .code = kReportingDisabled});
+    request.request.answer(
+        platform::Error{.domain = std::string(kErrorDomain), .code = kReportingDisabled}, {});
     return;
   }
   stamp(request.message);
@@ -72,13 +73,14 @@ void HVReportingClientServerInstance::carryOutSend(MessageRequest& request) {
   } else {
     sendToActiveSessions(request, delegate);
   }
-  request.reply(std::nullopt);
+  request.request.answer(std::nullopt, {});
 }
 
 void HVReportingClientServerInstance::sendToNamedSessions(const MessageRequest& request,
                                                           const Delegate& delegate) const {
   bool delivered = false;
-  for (const ReporterID reporterID : *request.reporterIDs) {
+  for (const platform::Value& value : *request.reporterIDs) {
+    const auto reporterID = static_cast<ReporterID>(value.toInt64());
     // An ID that is unknown is skipped silently, and one that is named twice gets the message
     // twice. Both are required.
     if (reporterID == kNoReporterID) continue;
@@ -130,7 +132,7 @@ void HVReportingClientServerInstance::sendStandalone(const MessageRequest& reque
 void HVReportingClientServerInstance::handToBackEnds(const MessageRequest& request,
                                                      const Session& session,
                                                      const Delegate& delegate) const {
-  const auto& [message, category, type, ids, senderName, reply, charge] = request;
+  const auto& [message, category, type, ids, senderName, posted, charge] = request;
   HVReportingTallyhubBridge::handleEvent(message, category, type, session);
   HVReportingJoulebookUtility::handleEvent(message, category, type, session, counters_->powerLog);
   HVReportingZUBBridge::handleEvent(message, category, type, session, counters_->issueMetrics);

@@ -101,18 +101,17 @@ std::size_t countReporterIDs(std::span<const Value> arguments) {
   return lists.empty() ? 0 : lists[0].array().size();
 }
 
+// The wire has no null. The list is wrapped in another one, which is empty if there is no list.
+Error tooManyLists(std::size_t count) {
+  return {
+      .description = "sendMessage: argument 4: expected at most one list of reporter IDs, found " +
+                     std::to_string(count),
+      .name = std::string(kInvalidArguments)};
+}
+
 void invokeSendMessage(ExportedObject& object, Invocation&& request) {
-  // The wire has no null. The list is wrapped in another one, which is empty if there is no list.
   const Array lists = request.arguments[3].array();
-  if (lists.size() > 1) {
-    request.reply(
-        Error{.description = "sendMessage: argument 4: expected at most one list of reporter IDs, "
-                             "found " +
-                             std::to_string(lists.size()),
-              .name = std::string(kInvalidArguments)},
-        Value());
-    return;
-  }
+  if (lists.size() > 1) return request.reply(tooManyLists(lists.size()), Value());
   HVReportingServiceProtocol::ReporterIDs reporters;
   if (!lists.empty()) {
     reporters = reporterIDs(lists[0].array());
@@ -121,6 +120,17 @@ void invokeSendMessage(ExportedObject& object, Invocation&& request) {
       request.arguments[0].dictionary(), enumeration<AudioEventCategory>(request.arguments[1]),
       enumeration<AudioEventType>(request.arguments[2]), std::move(reporters),
       errorReply(std::move(request.reply)), std::move(request.context));
+}
+
+void postSendMessage(ExportedObject& object, std::span<const Value> arguments,
+                     platform::PostedRequest&& request, platform::ProcessID sender) {
+  const Array lists = arguments[3].array();
+  if (lists.size() > 1) return request.answer(tooManyLists(lists.size()), Value());
+  std::optional<Array> reporters;
+  if (!lists.empty()) reporters = lists[0].array();
+  service(object).postMessage(
+      arguments[0].dictionary(), enumeration<AudioEventCategory>(arguments[1]),
+      enumeration<AudioEventType>(arguments[2]), std::move(reporters), std::move(request), sender);
 }
 
 void invokeStop(ExportedObject& object, Invocation&& request) {
@@ -173,7 +183,7 @@ constexpr std::array kMethods{
     InterfaceMethod{"setConfiguration", "a{sv}x", "b", kMore, invokeSetConfiguration},
     InterfaceMethod{"startReportingSessionForID", "x", "b", kMore, invokeStart},
     InterfaceMethod{"sendMessage", "a{sv}uqaax", "", kMore, invokeSendMessage, countReporterIDs,
-                    MethodAccess::kAnybody, kEntriesAddedToMessage},
+                    MethodAccess::kAnybody, kEntriesAddedToMessage, postSendMessage},
     InterfaceMethod{"stopReportingSessionForID", "x", "b", kNoMore, invokeStop},
     InterfaceMethod{"destroyReportingSession", "x", "b", kNoMore, invokeDestroy},
     InterfaceMethod{"reporterIDValid", "x", "a{sv}", kNoMore, invokeReporterIDValid},

@@ -33,6 +33,24 @@ const InterfaceMethod& methodNamed(const NSXPCInterface& interface, std::string_
   return *method;
 }
 
+// Collects the answers of a posted request. Holds a copy of `openRequests` until the request has
+// been carried out.
+class PostedCall final : public RequestSource {
+ public:
+  PostedCall(std::shared_ptr<FakeCall> call, std::shared_ptr<int> openRequests)
+      : call_(std::move(call)), openRequests_(std::move(openRequests)) {}
+
+  void answer(const RequestMark& /*mark*/, const std::optional<Error>& error,
+              const Value& value) override {
+    call_->add(error, value);
+  }
+  void carriedOut(const RequestMark& /*mark*/) override { openRequests_.reset(); }
+
+ private:
+  const std::shared_ptr<FakeCall> call_;
+  std::shared_ptr<int> openRequests_;
+};
+
 }  // namespace
 
 std::vector<FakeCall::Reply> FakeCall::replies() const {
@@ -76,6 +94,14 @@ std::shared_ptr<FakeCall> FakeConnection::call(std::string_view method,
                                    " is exceeded",
                     .name = "org.freedesktop.DBus.Error.LimitsExceeded"},
               Value());
+    return call;
+  }
+  if (target.post != nullptr) {
+    target.post(*object, arguments,
+                PostedRequest(std::make_shared<PostedCall>(call, openRequests_),
+                              {.wantsAnswer = true, .signature = target.out}),
+                pid_);
+    object->endOfRequests();
     return call;
   }
   target.invoke(*object,

@@ -81,6 +81,7 @@ void ClientConnection::deliver() {
     bytes += next.totalBytes;
     --requestsLeft;
   }
+  if (object_ != nullptr) object_->endOfRequests();
   // Needed in every turn: the next client reads into the same scratch.
   input().settle();
 }

@@ -12,6 +12,28 @@ constexpr UnitLog kLog{connectionCategory, "ReplyTicket"};
 
 }  // namespace
 
+void ClientLink::answer(const RequestMark& mark, const std::optional<Error>& error,
+                        const Value& value) {
+  if (inbox_->isLoopThread()) {
+    statistics_->repliesGiven.add();
+    deliver(mark.serial, mark.signature, error.has_value() ? &*error : nullptr, value);
+    return;
+  }
+  ReplyTicket::answer(
+      std::make_shared<ReplyTicket>(shared_from_this(), mark.serial, mark.signature), error, value);
+}
+
+void ClientLink::deliver(std::uint32_t serial, std::string_view signature, const Error* error,
+                         const Value& value) {
+  if (connection_ == nullptr) {
+    statistics_->repliesDroppedGone.add();
+  } else if (error != nullptr) {
+    connection_->sendServiceError(serial, *error);
+  } else {
+    connection_->sendReturn(serial, signature, value);
+  }
+}
+
 void ReplyTicket::answer(const std::shared_ptr<ReplyTicket>& ticket,
                          const std::optional<Error>& error, const Value& value) {
   ConnectionStatistics& statistics = ticket->client_->statistics();
@@ -33,16 +55,7 @@ void ReplyTicket::answer(const std::shared_ptr<ReplyTicket>& ticket,
 }
 
 void ReplyTicket::deliver(const Error* error, const Value& value) {
-  ClientConnection* connection = client_->connection();
-  if (connection == nullptr) {
-    client_->statistics().repliesDroppedGone.add();
-    return;
-  }
-  if (error != nullptr) {
-    connection->sendServiceError(serial_, *error);
-  } else {
-    connection->sendReturn(serial_, signature_, value);
-  }
+  client_->deliver(serial_, signature_, error, value);
 }
 
 }  // namespace halvox::platform::linux_

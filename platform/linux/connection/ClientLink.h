@@ -21,7 +21,7 @@ class ClientConnection;
 //   attached (the connection exists) --detach()--> detached: replies are dropped and counted
 //
 // Shared by the connection and its open requests and replies.
-class ClientLink : public std::enable_shared_from_this<ClientLink> {
+class ClientLink final : public RequestSource, public std::enable_shared_from_this<ClientLink> {
  public:
   ClientLink(std::shared_ptr<Inbox> inbox, std::shared_ptr<ConnectionStatistics> statistics)
       : inbox_(std::move(inbox)), statistics_(std::move(statistics)) {}
@@ -35,6 +35,17 @@ class ClientLink : public std::enable_shared_from_this<ClientLink> {
     if (flow_.close(cost)) inbox_->postRoom(shared_from_this());
   }
 
+  // On the I/O thread, where helped jobs run, the reply is encoded at once and written at the end
+  // of the turn. Other threads post it to the I/O thread.
+  void answer(const RequestMark& mark, const std::optional<Error>& error,
+              const Value& value) override;
+  void carriedOut(const RequestMark& mark) override {
+    requestDone({.requests = mark.weight, .bytes = mark.bytes});
+  }
+
+  // Hands a reply to the connection, unless that has finished. Only for the I/O thread.
+  void deliver(std::uint32_t serial, std::string_view signature, const Error* error,
+               const Value& value);
   // Returns the connection, or null after it has finished. Only for the I/O thread.
   [[nodiscard]] ClientConnection* connection() const { return connection_; }
   void attach(ClientConnection& connection) { connection_ = &connection; }

@@ -38,9 +38,13 @@ std::size_t weightOf(const InterfaceMethod& method) {
   return answersList ? kListRequestWeight : 1;
 }
 
+bool isAnswerUnwanted(const dbus::MessageHeader& header) {
+  return (header.flags & dbus::kNoReplyExpected) != 0;
+}
+
 ReplyCallback makeReply(const ClientConnection& client, const dbus::MessageHeader& header,
                         const InterfaceMethod& method) {
-  if ((header.flags & dbus::kNoReplyExpected) != 0) {
+  if (isAnswerUnwanted(header)) {
     // The object always calls its reply, even if D-Bus forbids sending one.
     return [](const std::optional<Error>&, const Value&) {};
   }
@@ -113,6 +117,10 @@ void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& m
   statistics_.requestsDelivered.add();
   ClientConnection& client = request.client;
   const FlowControl::Cost cost{.requests = weightOf(method), .bytes = request.frameBytes};
+  if (method.post != nullptr) {
+    post(request, method, cost);
+    return;
+  }
   method.invoke(
       *client.exportedObject(),
       Invocation{.arguments = arguments_,
@@ -120,6 +128,21 @@ void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& m
                  .context = {.sender = client.processIdentifier(),
                              .token = std::make_shared<OpenRequest>(client.link(), cost)}});
   // The values of one request must not live until the next.
+  arguments_.clear();
+}
+
+void RequestDispatcher::post(const Request& request, const InterfaceMethod& method,
+                             FlowControl::Cost cost) {
+  const ClientConnection& client = request.client;
+  const dbus::MessageHeader& header = request.header();
+  client.link()->flow().open(cost);
+  method.post(*client.exportedObject(), arguments_,
+              PostedRequest(client.link(), {.serial = header.serial,
+                                            .wantsAnswer = !isAnswerUnwanted(header),
+                                            .signature = method.out,
+                                            .weight = cost.requests,
+                                            .bytes = cost.bytes}),
+              client.processIdentifier());
   arguments_.clear();
 }
 
@@ -183,7 +206,7 @@ void RequestDispatcher::answerStandard(const Request& request, const StandardMet
                                                .arguments = arguments_,
                                                .identity = standard_.identity()});
   arguments_.clear();
-  if ((header.flags & dbus::kNoReplyExpected) != 0) return;
+  if (isAnswerUnwanted(header)) return;
   statistics_.repliesGiven.add();
   if (answer.errorName.empty()) {
     request.client.sendReturn(header.serial, method.out, answer.value);

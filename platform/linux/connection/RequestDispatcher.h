@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "platform/connection.h"
+#include "platform/linux/connection/FlowControl.h"
 #include "platform/linux/connection/StandardInterfaces.h"
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/linux/connection/wire/ValueDecoder.h"
@@ -30,6 +31,7 @@ class RequestDispatcher {
   struct Request;
 
   void deliver(const Request& request, const InterfaceMethod& method);
+  void post(const Request& request, const InterfaceMethod& method, FlowControl::Cost cost);
   [[nodiscard]] bool isForbidden(const Request& request, const InterfaceMethod& method);
   [[nodiscard]] bool isOverLimits(const Request& request, const InterfaceMethod& method);
   [[nodiscard]] bool namesTooManyReporters(const Request& request, const InterfaceMethod& method);
