@@ -161,6 +161,10 @@ TEST_F(DecodeCachesTest, BytesInTheOtherOrderAreNotTakenForKnownOnes) {
   expectSame(messageBody(typicalEntries(1, "x"), 1), true);
 }
 
+TEST_F(DecodeCachesTest, ZerosAreNotTakenForAKnownKey) {
+  expectSame(messageBody(WireBytes().raw(std::string(16, '\0')), 1));
+}
+
 TEST_F(DecodeCachesTest, EveryTruncationFailsAsBefore) {
   const std::string body = messageBody(typicalEntries(1, "a text"), 1);
   expectSame(body);

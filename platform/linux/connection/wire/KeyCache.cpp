@@ -49,7 +49,8 @@ KeyCache::Head KeyCache::find(std::string_view bytes) {
   if (length > bytes.size() - kLengthBytes - kTailBytes) return {};
   const std::string_view text = bytes.substr(kLengthBytes, length);
   Slot& slot = slotOf(text);
-  // The tail of a free slot is 0, which is not that of any entry.
+  // Bytes that are not valid can look like a free slot: an empty text and zeros.
+  if (!slot.key.has_value()) return {};
   if (wordAt<std::uint32_t>(text.data() + length) != slot.tail || text != slot.text) return {};
   const bool isRepeated = slot.dictionary == dictionary_;
   slot.dictionary = dictionary_;
