@@ -81,8 +81,32 @@ void decode(const Frame& frame) {
   checkCached(frame, error, arguments);
 }
 
+// The same for headers.
+void checkCachedHeader(std::span<const std::byte> bytes,
+                       const std::variant<Frame, WireError>& expected) {
+  static HeaderCache cache;
+  const auto result = readFrame(bytes, cache);
+  require(result.index() == expected.index());
+  if (const auto* error = std::get_if<WireError>(&result)) {
+    const auto& other = std::get<WireError>(expected);
+    require(error->message == other.message && error->offset == other.offset);
+    return;
+  }
+  const MessageHeader& header = std::get<Frame>(result).header;
+  const MessageHeader& other = std::get<Frame>(expected).header;
+  require(header.type == other.type && header.flags == other.flags &&
+          header.bigEndian == other.bigEndian && header.serial == other.serial &&
+          header.replySerial == other.replySerial && header.unixFds == other.unixFds);
+  require(header.path == other.path && header.interface == other.interface &&
+          header.member == other.member && header.errorName == other.errorName &&
+          header.destination == other.destination && header.sender == other.sender &&
+          header.signature == other.signature);
+  require(std::get<Frame>(result).body.data() == std::get<Frame>(expected).body.data());
+}
+
 void readWhole(std::span<const std::byte> bytes) {
   const auto result = readFrame(bytes);
+  checkCachedHeader(bytes, result);
   if (const auto* frame = std::get_if<Frame>(&result)) {
     require(frame->body.size() <= bytes.size());
     decode(*frame);
