@@ -119,6 +119,12 @@ void MessageRecords::onCommitted(FinishedRecords& finished) {
 void MessageRecords::endTransaction(FinishedRecords& finished) {
   lastText_ = {};
   lastPayload_ = {};
+  // No other record may come for hours. The summary of a long session is many megabytes.
+  encoder_.giveBack();
+  if (!hasTaken()) {
+    taken_.clear();
+    next_ = 0;
+  }
   for (Port* const port : {&events_, &links_}) {
     finished.written += std::exchange(port->written, 0);
     const std::uint64_t tooLarge = std::exchange(port->tooLarge, 0);

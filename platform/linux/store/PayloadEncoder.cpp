@@ -157,12 +157,16 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
   Text() { Reset(buffer_); }
 
   std::string_view write(const Dictionary& payload) {
-    // One large payload must not hold its memory for the life of the service.
-    if (buffer_.stack_.GetCapacity() > kKeptBufferBytes) buffer_ = rapidjson::StringBuffer();
+    giveBack();
     buffer_.Clear();
     Reset(buffer_);
     add(payload);
     return {buffer_.GetString(), buffer_.GetSize()};
+  }
+
+  // One large payload must not hold its memory for the life of the service.
+  void giveBack() {
+    if (buffer_.stack_.GetCapacity() > kKeptBufferBytes) buffer_ = rapidjson::StringBuffer();
   }
 
  private:
@@ -281,6 +285,8 @@ PayloadEncoder::PayloadEncoder() : text_(std::make_unique<Text>()) {}
 PayloadEncoder::~PayloadEncoder() = default;
 
 std::string_view PayloadEncoder::encode(const Dictionary& payload) { return text_->write(payload); }
+
+void PayloadEncoder::giveBack() { text_->giveBack(); }
 
 bool encodeAlike(const Dictionary& left, const Dictionary& right) {
   if (left.isIdenticalTo(right)) return true;

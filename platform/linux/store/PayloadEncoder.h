@@ -16,7 +16,8 @@ namespace halvox::platform::linux_ {
 //   NaN, infinities  the texts "NaN", "Infinity" and "-Infinity", which JSON has no numbers for
 //   text             as it is; each byte that is not part of valid UTF-8 becomes U+FFFD
 //
-// Belongs to one thread. Keeps its buffer between texts, unless a text was longer than 256 KiB.
+// Belongs to one thread. Keeps its buffer between texts, unless a text was longer than 256 KiB
+// and giveBack() or encode() is called after it.
 class PayloadEncoder {
  public:
   PayloadEncoder();
@@ -26,6 +27,8 @@ class PayloadEncoder {
 
   // Returns the text, valid until the next call. Cannot fail.
   [[nodiscard]] std::string_view encode(const Dictionary& payload);
+  // Frees the buffer if the last text was long. That text is no longer valid.
+  void giveBack();
 
  private:
   class Text;
