@@ -3,6 +3,7 @@
 #include <chrono>
 #include <string>
 
+#include <malloc.h>
 #include <sysexits.h>
 
 #include "platform/linux/LinuxAdapters.h"
@@ -41,12 +42,27 @@ const char* busName(BusKind kind) {
   return "";
 }
 
+// Blocks from this size on are mappings of their own, which free() returns to the system. Without a
+// fixed value, glibc raises the limit to the largest block that was ever freed. The summaries of
+// one long session would then stay in the heap until the process ends.
+constexpr int kMappedBytes = 256 * 1024;
+// How much free memory the end of the heap may keep. More than a busy service allocates and frees
+// again all the time, so that it does not pay for it with system calls.
+constexpr int kKeptBytes = 2 * 1024 * 1024;
+
+void limitFreeMemory() {
+  ::mallopt(M_MMAP_THRESHOLD, kMappedBytes);
+  ::mallopt(M_TRIM_THRESHOLD, kKeptBytes);
+}
+
 }  // namespace
 
 LinuxPlatform::LinuxPlatform(const Configuration& configuration)
     : adapters_(std::make_unique<LinuxAdapters>(
           configuration, [this] { logStatistics(LogLevel::kDefault, Counters::kAll); })),
-      log_(adapters_->log->createCategory("com.tarno.halvox", "main"), "LinuxPlatform") {}
+      log_(adapters_->log->createCategory("com.tarno.halvox", "main"), "LinuxPlatform") {
+  limitFreeMemory();
+}
 
 LinuxPlatform::~LinuxPlatform() = default;
 
