@@ -52,6 +52,7 @@ SqliteCode MessageBlocks::prepare(Database& database) {
 
 void MessageBlocks::release() {
   statements_ = {};
+  writer_.release();
   isStateKnown_ = false;
 }
 
