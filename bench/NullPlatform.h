@@ -211,7 +211,7 @@ struct NullPlatform {
   NullLog log;
   NullProcess process;
   MapStatistics statistics;
-  // Not absent: a long history that is not kept would cost less than a real one.
+  // The real one: without it, a long history would lose messages and cost less than in the service.
   platform::linux_::FileOverflowService overflow{
       {.directory = std::filesystem::temp_directory_path()}, statistics};
 };

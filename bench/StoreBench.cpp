@@ -205,7 +205,7 @@ BENCHMARK(storeMessage)
     ->Unit(benchmark::kMicrosecond)
     ->UseRealTime();
 
-// What a store costs that takes both events and the link message of each message: CPU of the whole
+// The cost of a store that takes both events and the link message of each message: CPU of the whole
 // process beside that of making the messages, bytes written to disk, bytes of the closed file.
 void storeAll(benchmark::State& state) {
   const bool isVaried = state.range(0) == 1;

@@ -22,13 +22,13 @@ class ByteBuffer {
   [[nodiscard]] std::size_t size() const { return size_; }
   [[nodiscard]] std::span<const char> bytes() const { return {data_, size_}; }
 
-  // Returns the end, with room for that many bytes more. Throws std::bad_alloc, and then changes
-  // nothing.
+  // Returns the end of the content, after which there is room for `extra` bytes. If it throws
+  // std::bad_alloc, nothing is changed.
   char* reserve(std::size_t extra) {
     if (extra > capacity_ - size_) grow(extra);
     return data_ + size_;
   }
-  // Ends the content there, within what is reserved.
+  // Sets the end of the content, which must be within the reserved room.
   void setEnd(const char* end) { size_ = static_cast<std::size_t>(end - data_); }
   void setSize(std::size_t size) { size_ = size; }
 

@@ -18,13 +18,13 @@ namespace halvox::client {
 class ClientThread {
  public:
   ClientThread() = default;
-  // Waits for the end of the work.
+  // Waits until the work has returned.
   ~ClientThread();
   ClientThread(const ClientThread&) = delete;
   ClientThread& operator=(const ClientThread&) = delete;
 
   // Runs the work on a new thread. Call it once. Throws std::system_error if no thread can be
-  // started, and std::bad_alloc. No exception may leave `work`.
+  // started, or std::bad_alloc. `work` must not throw.
   void start(std::function<void()> work);
   // Returns true on the thread itself, while it runs.
   [[nodiscard]] bool isCurrent() const;

@@ -25,7 +25,7 @@ template void EncodedArray::appendVariant(const platform::Date& value);
 template void EncodedArray::appendVariant(const WireData& value);
 
 void EncodedArray::append(const EncodedArray& array) {
-  // The room first: it may move the elements, and `array` may be this one.
+  // Reserve first: that may move the elements, and `array` may be this one.
   reserve(variantRoom(array.wireForm()));
   appendVariant(array.wireForm());
 }

@@ -11,12 +11,12 @@ namespace halvox::client {
 
 class EncodedDictionary;
 
-// A list of values, kept as the bytes that they are on the wire. Several threads may read one at
-// the same time; while one thread changes it, no other may use it.
+// A list of values in their encoding on the wire. Belongs to the program. Several threads may read
+// one at the same time; while one thread changes it, no other may use it.
 //
 // Padding depends on where the array begins in its message: at a multiple of 8 or 4 bytes after
-// one. The array keeps its elements in both forms. A message that takes it then copies bytes, and
-// need not understand them.
+// one. The array keeps its elements in both forms. A message copies the form that fits, without
+// decoding it.
 class EncodedArray {
  public:
   EncodedArray();
@@ -25,7 +25,7 @@ class EncodedArray {
 
   [[nodiscard]] std::size_t size() const { return size_; }
 
-  // Append one value, which is copied. Throw std::bad_alloc, and then change nothing. A text must
+  // Append a copy of one value. If they throw std::bad_alloc, the array is unchanged. A text must
   // be UTF-8 without NUL; for another one, append() returns false and changes nothing.
   template <platform::ArithmeticNumber Number>
   void append(Number number) {

@@ -18,14 +18,14 @@ constexpr std::size_t kKeyRoom = 24;
 
 constexpr std::size_t roundUp(std::size_t size) { return (size + 7) & ~std::size_t{7}; }
 
-// What one pass over a key finds out.
+// The results of one pass over a key.
 struct KeyScan {
   std::uint32_t hash = 0;
   bool isPlain = false;  // ASCII without NUL; anything else needs the full test
 };
 
-// Reads texts of up to 32 bytes as two or four words that may overlap: without a loop, whose end
-// the processor could not predict. The program chooses its keys; the hash therefore needs no
+// Reads texts of up to 32 bytes as two or four words that may overlap. A loop would have an end
+// that the processor cannot predict. The program chooses its keys; the hash therefore needs no
 // secret.
 inline KeyScan scan(std::string_view key) {
   constexpr std::uint64_t kFactors[] = {0x9E3779B97F4A7C15, 0xC2B2AE3D27D4EB4F, 0x165667B19E3779F9,
@@ -279,7 +279,7 @@ bool EncodedDictionary::set(std::string_view key, std::span<const std::byte> byt
 }
 
 bool EncodedDictionary::set(std::string_view key, const EncodedDictionary& dictionary) {
-  // The room first: it may move the entries, and `dictionary` may be this one.
+  // Reserve first: that may move the entries, and `dictionary` may be this one.
   reserve(kKeyRoom + key.size() + variantRoom(dictionary.wireForm()));
   return setVariant(key, dictionary.wireForm());
 }

@@ -14,8 +14,8 @@ namespace halvox::client {
 
 class EncodedArray;
 
-// A dictionary that is kept as the bytes that it is on the wire. For messages that are sent again
-// and again: sending copies the bytes, and a new number for a key overwrites the old one in place.
+// A dictionary in its encoding on the wire. For messages that are sent again and again: sending
+// copies the bytes, and a new number for a key overwrites the old one in place.
 // Belongs to the program. Several threads may read one at the same time, and sending it counts as
 // reading; while one thread changes it, no other may use it.
 //
@@ -25,7 +25,7 @@ class EncodedArray;
 // Each entry begins at a multiple of 8. Entries can therefore move by such multiples without a
 // change inside. Up to 512 bytes and 16 entries need no memory but the object itself.
 //
-// set() copies the key and the value. It throws std::bad_alloc, and then changes nothing. An
+// set() copies the key and the value. If it throws std::bad_alloc, the dictionary is unchanged. An
 // existing key keeps its position. A number or a date that replaces one of the same type allocates
 // nothing.
 class EncodedDictionary {
@@ -45,7 +45,7 @@ class EncodedDictionary {
   bool set(std::string_view key, std::string_view text);
   bool set(std::string_view key, const char* text) { return set(key, std::string_view(text)); }
   bool set(std::string_view key, std::span<const std::byte> bytes);
-  // The inner container is stored as it is now. It may be this dictionary.
+  // Stores a copy of the inner container, which may be this dictionary.
   bool set(std::string_view key, const EncodedDictionary& dictionary);
   bool set(std::string_view key, const EncodedArray& array);
   // Returns false if there was no such key.
@@ -53,8 +53,8 @@ class EncodedDictionary {
 
   // The entries; valid until this dictionary is changed.
   [[nodiscard]] WireDictionary wireForm() const { return {bytes_.bytes(), levels_}; }
-  // The same dictionary as a value; std::nullopt if it is nested deeper than a message can be, or
-  // longer.
+  // The same dictionary as a value; std::nullopt if it is nested deeper, or is longer, than a
+  // message can be.
   [[nodiscard]] std::optional<platform::Dictionary> decode() const;
 
  private:
@@ -69,7 +69,7 @@ class EncodedDictionary {
     std::uint8_t levels;   // of the value
     std::uint8_t padding;  // the bytes after the entry, up to a multiple of 8
   };
-  // The first entries in place, all of them on the heap once there are more.
+  // A few entries are in the object itself. When there are more, all of them are on the heap.
   class Entries {
    public:
     [[nodiscard]] std::size_t size() const { return size_; }
@@ -110,10 +110,11 @@ class EncodedDictionary {
   ByteBuffer<512> bytes_;
   Entries entries_;
   unsigned levels_ = 0;  // of the deepest value
-  // A bit for the hash of each key that has ever been set: most new keys need no comparison.
+  // A bit for the hash of each key that was ever set. Most new keys find theirs unset and need no
+  // comparison.
   std::uint64_t seen_ = 0;
-  // Of a large dictionary: the number of an entry plus 1, at a place that its hash chooses; 0 if
-  // the place is free. Its size is a power of two.
+  // Only for a large dictionary: the number of an entry plus 1, at a place that its hash chooses; 0
+  // if the place is free. Its size is a power of two.
   std::vector<std::uint32_t> table_;
 };
 

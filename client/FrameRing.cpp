@@ -83,7 +83,7 @@ EncodeOutcome FrameRing::tryPush(const MessageView& message) { return push(messa
 
 template <typename Content>
 [[gnu::hot]] EncodeOutcome FrameRing::push(const BasicMessageView<Content>& message) {
-  // publish() tests this again. The test here saves encoding the message while the ring is full.
+  // publish() tests this again. The test here avoids encoding a message while the ring is full.
   if (isFull(newest_.load(std::memory_order_relaxed))) return EncodeOutcome::kNoRoom;
   ChainSource cells(*this);
   SegmentWriter writer(cells);
@@ -208,8 +208,8 @@ void FrameRing::release() {
   touchAhead();
 }
 
-// Has the kernel map what the producers need next. Kernels before 5.14 refuse; the producers then
-// have the page faults.
+// Has the kernel map what the producers need next. Kernels before 5.14 refuse. The producers then
+// take the page faults.
 void FrameRing::touchAhead() {
   const std::size_t all = std::size_t{cells_} * kCellBytes;
   const std::size_t used = std::size_t{fresh_.load(std::memory_order_relaxed)} * kCellBytes;

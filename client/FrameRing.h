@@ -31,7 +31,7 @@ namespace halvox::client {
 // Rejected: a list of dictionaries, encoded by the consumer. The program's next change of a
 // dictionary would then have to copy it, on the audio thread. Also rejected: one ring of bytes. All
 // of it would be in memory after the first lap, which is too much for each audio process. Slots in
-// the order of the frames, which were here before, took one more atomic exchange for each message.
+// the order of the frames were tried. They took one more atomic exchange for each message.
 class FrameRing {
  public:
   // Throws std::bad_alloc.

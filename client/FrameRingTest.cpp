@@ -140,7 +140,7 @@ TEST(FrameRingTest, FramesTakenNowhereAreGone) {
   EXPECT_EQ(takeNumber(ring), 2);
 }
 
-// The consumer takes what there is as one list. Frames that come meanwhile are after it.
+// The consumer takes all frames as one list. Frames that come meanwhile follow that list.
 TEST(FrameRingTest, FramesThatComeWhileOthersAreTakenComeOutAfterThem) {
   FrameRing ring(100, kPlentyOfBytes);
   for (int number = 0; number < 3; ++number) ASSERT_TRUE(pushNumber(ring, number));

@@ -135,8 +135,8 @@ class HalvoxClient {
             Category category, EventType type);
   bool sendTo(std::span<const ReporterID> ids, const Dictionary& message, Category category,
               EventType type);
-  // The same for a message that is kept in its encoded form (client/EncodedDictionary.h), which
-  // these only copy.
+  // The same for a message in its encoded form (client/EncodedDictionary.h). Copies the bytes and
+  // encodes nothing.
   bool send(ReporterID id, const EncodedDictionary& message, Category category, EventType type);
   bool sendTo(std::span<const ReporterID> ids, const EncodedDictionary& message, Category category,
               EventType type);

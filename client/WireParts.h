@@ -29,8 +29,8 @@ inline Number load(const char* from) {
   return number;
 }
 
-// Returns true for ASCII without NUL, which nearly all texts are. Saves them the call of the full
-// test, which checks the last bytes one by one.
+// Returns true for ASCII without NUL. Nearly all texts are, and need not go through the full test,
+// which checks the last bytes one by one.
 inline bool isPlainText(std::string_view text) {
   constexpr std::size_t kWord = sizeof(std::uint64_t);
   const auto signs = [&](std::size_t at) {
@@ -50,8 +50,7 @@ inline bool isWireText(std::string_view text) {
   return isPlainText(text) || platform::linux_::isUtf8WithoutNul(text);
 }
 
-// Copies a text. Its length is mostly small but seldom a constant, and memcpy() would then be a
-// function call.
+// Copies a text. The length is usually small and not a constant; memcpy() would be a function call.
 inline char* copyText(char* to, std::string_view text) {
   const std::size_t size = text.size();
   if (size >= 8 && size <= 32) {
@@ -83,7 +82,7 @@ inline char* put(char* at, Number number) {
 }
 
 // Appends the signature of one basic type. Also writes a zero after it: four bytes are one store,
-// and three would go through the stack.
+// whereas three would go through the stack.
 inline char* putSignature(char* at, char type) {
   const char bytes[4] = {1, type, 0, 0};
   std::memcpy(at, bytes, sizeof bytes);

@@ -28,10 +28,10 @@
  * Ownership: release the result of a ..._new function with the ..._free function of the same kind;
  * these accept NULL and do nothing. Functions copy all other arguments before they return.
  *
- * Cost: dictionaries and arrays keep their content as the bytes that a message is made of. Sending
- * a dictionary copies these bytes, and storing one container in another copies the inner one's.
- * Make a message once, and change its values: a new number, or a text of the same length, for an
- * existing key overwrites the old one and allocates nothing. Up to 16 keys and 512 bytes need no
+ * Cost: dictionaries and arrays keep their content in the encoding of a message. Sending a
+ * dictionary copies these bytes, and storing one container in another copies those of the inner
+ * one. Make a message once, and change its values: a new number, or a text of the same length, for
+ * an existing key overwrites the old one and allocates nothing. Up to 16 keys and 512 bytes need no
  * memory but that of halvox_dictionary_new().
  *
  * Errors: functions that can fail return a halvox_result, or NULL or false as their comment says.

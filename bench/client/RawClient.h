@@ -32,7 +32,7 @@ class RawClient {
   void waitForAnswer();
   // From now on, each message has a device and a route of its own instead of the same two texts.
   void varyTexts() { variesTexts_ = true; }
-  // A text of letters that hardly compresses and differs for each number.
+  // A text of letters that hardly compresses. Each number gives another text.
   static std::string mixedText(std::int64_t number, std::size_t length);
   // The size of one frame in bytes.
   [[nodiscard]] std::size_t frameBytes();

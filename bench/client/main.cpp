@@ -189,9 +189,10 @@ std::int64_t pageFaults() {
   return usage.ru_minflt + usage.ru_majflt;
 }
 
-// Nanoseconds in halvox_client_send(): bursts of 8 messages every millisecond, as the threads of a
-// busy audio process send them. The others show the interference of the machine: kNothing times an
-// empty section, and kSpin a loop of 120 ns. An interrupt hits a longer section more often.
+// Nanoseconds in halvox_client_send(): bursts of 8 messages every millisecond, like those of the
+// threads of a busy audio process. The other kinds show the interference of the machine: kNothing
+// times an empty section, and kSpin a loop of 120 ns. An interrupt hits a longer section more
+// often.
 Values callerLatency(const std::string& socketPath, int count, Timed timed) {
   const Client client = makeClient(socketPath);
   const Message message = makeMessage(0);

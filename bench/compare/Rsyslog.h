@@ -21,8 +21,8 @@ class Rsyslog {
   // Blocks until the file has that many lines. Throws after a minute without a new line.
   void waitForLines(std::int64_t count);
 
-  // Sends `count` messages of the same ten fields as RawClient, as JSON. A full socket blocks, so
-  // none is lost. Any thread may call this.
+  // Sends `count` messages of the same ten fields as RawClient, as JSON. Blocks while
+  // the socket is full: no message is lost. Any thread may call this.
   void send(std::int64_t count, bool variesTexts) const;
 
  private:
