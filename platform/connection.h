@@ -47,8 +47,8 @@ struct ResourceUse {
 class ExportedObject {
  public:
   virtual ~ExportedObject() = default;
-  // The requests that were posted lately are all that have arrived. Called on the connection's
-  // thread after each series of InterfaceMethod::post.
+  // Ends a series of calls of InterfaceMethod::post: no further request has arrived. Called on the
+  // connection's thread.
   virtual void endOfRequests() {}
   // What the service holds for this client now. Called on the connection's thread; never blocks.
   [[nodiscard]] virtual ResourceUse resourceUse() const { return {}; }
@@ -83,8 +83,8 @@ struct RequestMark {
   std::size_t bytes = 0;
 };
 
-// The connection's part that outlives it. Shared by the connection and its open requests. Any
-// thread may call.
+// The part of a connection that outlives it: where its requests are answered. Shared by the
+// connection and its open requests. Any thread may call.
 class RequestSource {
  public:
   virtual ~RequestSource() = default;
@@ -95,8 +95,8 @@ class RequestSource {
   virtual void carriedOut(const RequestMark& mark) = 0;
 };
 
-// A ReplyCallback and a RequestToken in one, for the requests of which there are most: it needs no
-// allocation. The request counts as open as long as this exists. Belongs to one thread at a time.
+// A ReplyCallback and a RequestToken in one, which needs no allocation. For the most frequent
+// requests. The request counts as open as long as this exists. Belongs to one thread at a time.
 class PostedRequest {
  public:
   PostedRequest() = default;

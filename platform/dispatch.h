@@ -58,10 +58,10 @@ class DispatchQueue {
   virtual void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
                       std::optional<std::chrono::nanoseconds> timeout,
                       std::function<void(WaitOutcome)> then) = 0;
-  // Begins a job of the calling thread at once, if the queue runs none, has none and waits for
-  // nothing: the thread then does the work as a job of this queue, and calls leave(). The work must
-  // be brief and must not call waitOn(). Returns false if that is not possible; the caller then
-  // adds a job. A queue may always decline. Use QueueEntry.
+  // Returns true if the queue runs no job, has none to run and does not wait. The calling thread
+  // then does its work as a job of this queue, and calls leave(). The work must be brief and must
+  // not call waitOn(). After false, the caller adds a job. A queue may always decline. Use
+  // QueueEntry.
   [[nodiscard]] virtual bool tryEnter() { return false; }
   virtual void leave() {}
   // True on the thread that is running a job of this queue at the moment. For assertions.
@@ -69,7 +69,7 @@ class DispatchQueue {
 };
 
 // Brief work that the calling thread does in a queue without adding a job, while this object
-// exists. Work of which there is much costs neither an allocation nor a change of threads then.
+// exists. Frequent work then needs neither an allocation nor a change of threads.
 class QueueEntry {
  public:
   // `queue` must outlive this.

@@ -15,8 +15,8 @@ struct OverflowPlace {
   std::size_t length = 0;  // in bytes
 };
 
-// Keeps bytes outside memory for as long as the process lives: what a client may make the service
-// keep, but nobody reads soon. Nothing of it remains after the process, however it ends.
+// Keeps bytes outside memory for the life of the process. For bytes that clients make the service
+// keep and that are read late or never. Nothing remains after the process, however it ends.
 //
 // Any thread may call. Writing and reading may wait for the disk, usually for less time than the
 // bytes take to copy, because they go through the page cache. The composition root owns the
@@ -25,7 +25,7 @@ class OverflowService {
  public:
   virtual ~OverflowService() = default;
 
-  // How many bytes one client may make the service keep in memory before its histories overflow.
+  // How many bytes of memory one client may take before its histories overflow.
   [[nodiscard]] virtual std::size_t memoryPerClient() const = 0;
 
   // Keeps a copy of the bytes and sets `place`. On an error nothing is kept, and `place` is
@@ -35,7 +35,7 @@ class OverflowService {
   // Reads the bytes at a place that write() returned. `bytes` has the length of the place.
   [[nodiscard]] virtual std::optional<Error> read(OverflowPlace place,
                                                   std::span<std::byte> bytes) = 0;
-  // Gives the room at a place back. The place is not valid any more.
+  // Gives the room at a place back. The place must not be used again.
   virtual void release(OverflowPlace place) = 0;
 };
 

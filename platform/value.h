@@ -335,9 +335,9 @@ class Array {
 // holder sees the change of another. Different threads may use different copies at once; one object
 // belongs to one thread at a time.
 //
-// One change needs no copy: a new entry behind all others, if reserve() has made room for it. Each
-// holder knows how many of the shared entries are its own. A message is thus stamped, tagged and
-// kept in one block of memory, although consumers hold it without its tag.
+// One change needs no copy: adding an entry after all others, if reserve() has made room for it.
+// Each holder knows how many of the shared entries are its own. A message is stamped, tagged and
+// kept in one block of memory, although some consumers hold it without its tag.
 //
 // Entries are enumerated in the order in which their keys were first set. A small dictionary is
 // searched key by key, a large one by an index with a secret hash. The time that a client's keys

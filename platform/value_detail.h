@@ -72,13 +72,13 @@ struct ArrayRep {
   [[nodiscard]] Value* values() { return reinterpret_cast<Value*>(this + 1); }
 };
 
-// The entries of dictionaries, in the order of setting. A dictionary consists of the first entries,
-// as many as it knows. An entry that was added while several dictionaries shared the node belongs
-// to the one that added it. With an index, all of them have all entries.
+// The entries of dictionaries, in the order of setting. Several dictionaries may share a node. Each
+// consists of the first `count_` entries. An entry that was added while the node was shared belongs
+// to the dictionary that added it. If there is an index, each of them has all entries.
 struct DictionaryRep {
   ReferenceCount references;
-  // The entries that were made. Relaxed: it only decides which dictionary may make the next one.
-  // Whoever reads that entry has got it from the one that made it.
+  // The number of entries that were made. Relaxed: it only decides which dictionary may make the
+  // next one. A thread that reads an entry has received the dictionary from the one that made it.
   std::atomic<std::uint32_t> used;
   std::uint32_t capacity;
   std::uint32_t indexSize;  // a power of two; 0 while the dictionary is small

@@ -89,8 +89,8 @@ Dictionary::Entry* findEntry(const Reference& rep, std::size_t count, const Key&
   const auto matches = [&key](const Dictionary::Entry& entry) { return entry.key == key; };
   if (rep->indexSize != 0) return findIndexedEntry(rep, key.text(), matches);
   if (!key.isInterned()) return findEntry(rep, count, matches);
-  // Reads no key of the dictionary: a message is searched for several keys, nearly all of which it
-  // does not have.
+  // Compares nodes and reads no text: a message is searched for several keys, nearly all of which
+  // it does not have.
   return findEntry(rep, count,
                    [&key](const Dictionary::Entry& entry) { return entry.key.sharesNode(key); });
 }
@@ -138,7 +138,7 @@ void Dictionary::makeRoomFor(std::size_t entries) {
   }
   const bool alone = isAlone();
   if (alone) {
-    // Entries of other dictionaries, which exist no longer.
+    // The entries of other dictionaries, which have been destroyed.
     const std::uint32_t used = rep_->used.exchange(count_, std::memory_order_relaxed);
     std::destroy_n(rep_->entries() + count_, used - count_);
     if (entries <= rep_->capacity) return;
@@ -180,8 +180,8 @@ void Dictionary::add(const Key& key, Value value) {
   noteAppended(*rep_, count_);
 }
 
-// Adds an entry behind those of all holders, which do not see it. Returns false if that is not
-// possible.
+// Adds an entry after those of all holders. The other holders do not see it. Returns false if that
+// is not possible.
 bool Dictionary::tryAddShared(const Key& key, Value& value) {
   if (rep_ == nullptr || count_ >= rep_->capacity || count_ >= kMaxWithoutIndex) return false;
   std::uint32_t expected = count_;

@@ -17,7 +17,7 @@ class FakeOverflowService final : public OverflowService {
  public:
   // 64 MiB at first.
   void setMemoryPerClient(std::size_t bytes);
-  // From now on writing, or reading, fails with that error; none ends it.
+  // From now on writing, or reading, fails with that error; std::nullopt ends this.
   void setWriteError(std::optional<Error> error);
   void setReadError(std::optional<Error> error);
 

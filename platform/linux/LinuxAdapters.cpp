@@ -48,8 +48,8 @@ bool isTracingEnabled(FeatureFlagService& features) {
 }
 
 // If trace points are not available, the service runs without them and logs the reason at the
-// start. LTTng maps the buffers of every session that records into each process that has loaded it,
-// so the service loads it only if somebody may want its trace points.
+// start. LTTng maps the buffers of every session that records into each process that has loaded it.
+// The service therefore loads it only if the configuration asks for trace points.
 TracePoints makeTracePoints(const Configuration& configuration, FeatureFlagService& features) {
   if (!configuration.tracePoints && !isTracingEnabled(features)) {
     return {std::make_unique<NoKdebugService>(), "none, diagnostics.trace_points is not true"};

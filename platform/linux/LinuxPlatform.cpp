@@ -46,8 +46,8 @@ const char* busName(BusKind kind) {
 // fixed value, glibc raises the limit to the largest block that was ever freed. The summaries of
 // one long session would then stay in the heap until the process ends.
 constexpr int kMappedBytes = 256 * 1024;
-// How much free memory the end of the heap may keep. More than a busy service allocates and frees
-// again all the time, so that it does not pay for it with system calls.
+// How much free memory the end of the heap may keep. A busy service allocates and frees less than
+// this all the time, and does so without system calls.
 constexpr int kKeptBytes = 2 * 1024 * 1024;
 
 void limitFreeMemory() {

@@ -43,7 +43,7 @@ class ClientLink final : public RequestSource, public std::enable_shared_from_th
     requestDone({.requests = mark.weight, .bytes = mark.bytes});
   }
 
-  // Hands a reply to the connection, unless that has finished. Only for the I/O thread.
+  // Hands a reply to the connection unless it has finished. I/O thread only.
   void deliver(std::uint32_t serial, std::string_view signature, const Error* error,
                const Value& value);
   // Returns the connection, or null after it has finished. Only for the I/O thread.

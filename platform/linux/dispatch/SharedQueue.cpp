@@ -49,7 +49,7 @@ bool SharedQueue::tryEnter() {
   if (pool_->isStopped()) return false;
   {
     const MutexLock lock(mutex_);
-    // A turn that is asked for or runs has jobs before this one.
+    // A turn that runs or was asked for has work that comes first.
     if (hasTurn_ || isWaiting_) return false;
     hasTurn_ = true;
     pool_->beginTurn();

@@ -17,7 +17,7 @@ namespace {
 constexpr mode_t kPermissions = 0600;  // what clients reported
 constexpr std::uint64_t kMegabyte = 1024 * 1024;
 constexpr std::uint64_t kSharesOfMemory = 4;
-// Only whole blocks can be punched out of a file. Pieces that begin on a block share none.
+// Only whole blocks can be punched out of a file. Each piece begins at a block: no two share one.
 constexpr std::uint64_t kBlock = 4096;
 
 std::uint64_t blocksOf(std::size_t length) { return (length + kBlock - 1) / kBlock * kBlock; }
@@ -119,7 +119,7 @@ void FileOverflowService::release(OverflowPlace place) {
 void FileOverflowService::giveBack(OverflowPlace place) {
   used_ -= place.length;
   if (used_ == 0) {
-    // Nobody writes now: a writer has its bytes counted before it begins.
+    // No thread is writing: a writer adds its bytes to used_ before it begins.
     end_ = ::ftruncate(file_.get(), 0) == 0 ? 0 : end_;
     return;
   }

@@ -18,7 +18,7 @@ struct OverflowOptions {
   // Where the file is. The directory is made when the file is needed.
   std::filesystem::path directory;
   // MiB of memory that the service keeps for one client. Histories begin to overflow at a quarter
-  // of it, because what else a client makes the service keep cannot leave memory.
+  // of it. The rest is for what cannot leave memory.
   std::uint64_t clientMegabytes = defaults::kClientHistoryMegabytes;
 };
 

@@ -203,7 +203,7 @@ TEST_F(MessageBlocksTest, ReaderReportsADamagedBlockAfterTheRecordsBeforeIt) {
 class MessageKeysTest : public MessageBlocksTest {
  protected:
   // Stores blocks of three sessions, one after the other, and damages all blocks but those of the
-  // second: whoever reads one of them gets an error.
+  // second: a reader of one of them gets an error.
   void storeSessions() {
     start();
     for (std::int64_t session = 1; session <= 3; ++session) {

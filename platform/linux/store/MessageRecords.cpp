@@ -64,7 +64,7 @@ SqliteCode MessageRecords::write(TransactionAllowance& allowance) {
 }
 
 SqliteCode MessageRecords::writeNext(TransactionAllowance& allowance) {
-  // Move the record out: its memory is freed while a large batch is written.
+  // Move the record out: its memory is freed at once, not after the whole batch.
   Record record = std::move(taken_[next_]);
   Port& port = portOf(record);
   ++next_;
@@ -119,7 +119,7 @@ void MessageRecords::onCommitted(FinishedRecords& finished) {
 void MessageRecords::endTransaction(FinishedRecords& finished) {
   lastText_ = {};
   lastPayload_ = {};
-  // No other record may come for hours. The summary of a long session is many megabytes.
+  // The next record may come after hours. The text of a long session's summary is many megabytes.
   encoder_.giveBack();
   if (!hasTaken()) {
     taken_.clear();

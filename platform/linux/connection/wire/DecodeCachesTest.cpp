@@ -11,7 +11,7 @@
 #include "platform/linux/connection/wire/ValueDecoder.h"
 #include "platform/linux/connection/wire/testdata/TestFrames.h"
 
-// The caches of the decoder must not change what it returns, whatever they hold.
+// The content of the decoder's caches must not change what it returns.
 namespace halvox::platform::linux_::dbus {
 namespace {
 

@@ -91,9 +91,9 @@ struct FrameMeasure {
 // After an error, the rest of the stream cannot be read. Allocates memory only for errors.
 [[nodiscard]] std::variant<Frame, WireError> readFrame(std::span<const std::byte> frame);
 
-// The headers of frames that were read lately. The calls of a client differ in their serial number
-// only: a header whose fields are known need not be read again, which was a twelfth of the work for
-// a message. Belongs to one thread. Owned by the caller of readFrame().
+// The headers of recently read frames. The calls of a client often differ only in their serial
+// number. A header whose fields are known need not be read again: reading it is a twelfth of the
+// work for a message. Belongs to one thread. Owned by the caller of readFrame().
 class HeaderCache {
  public:
   HeaderCache() = default;

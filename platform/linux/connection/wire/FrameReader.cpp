@@ -203,7 +203,7 @@ std::variant<Frame, WireError> finish(MessageHeader header, std::span<const std:
   return Frame{header, body};
 }
 
-// Reads the fields, or takes them from the cache, unless it is null.
+// Takes the fields from the cache if it is not null and has them. Otherwise reads them.
 std::optional<WireError> readFields(std::span<const std::byte> fields, MessageHeader& header,
                                     HeaderCache* cache) {
   if (cache != nullptr) {
@@ -297,7 +297,7 @@ void HeaderCache::note(const MessageHeader& header, std::span<const std::byte> f
   Slot& slot = slots_[indexOf(fields)];
   slot.fields.assign(reinterpret_cast<const char*>(fields.data()), fields.size());
   slot.header = header;
-  // The fields were read without an error a moment ago, and are read again at their new place.
+  // The caller has read these fields without an error. Read them again at their new place.
   MessageHeader& moved = slot.header;
   static_cast<void>(
       FieldReader(std::as_bytes(std::span(slot.fields)), header.bigEndian, moved).readAll());

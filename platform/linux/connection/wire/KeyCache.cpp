@@ -6,7 +6,7 @@ namespace halvox::platform::linux_::dbus {
 namespace {
 
 constexpr std::size_t kLengthBytes = 4;
-// Behind the text: a NUL, the length of the signature, its one character and another NUL.
+// After the text: a NUL, the length of the signature, its one character and another NUL.
 constexpr std::size_t kTailBytes = 4;
 constexpr std::string_view kBasicTypes = "ynqiuxtdbsog";
 

@@ -10,15 +10,15 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// The keys that entries of a{sv} dictionaries had lately, each with the type of its last value.
+// The recent keys of entries of a{sv} dictionaries, each with the type of its last value.
 //
 // Messages of a client have the same keys again and again. An entry whose first bytes are known
 // needs no check of its text, no look-up in the table of interned keys and no check of its
-// variant's signature: these were half of the work for a message.
+// variant's signature: these are half of the work for a message without the cache.
 //
 // A key has one slot, which depends on its text only. The cache can therefore tell whether a
-// dictionary has a key twice. Keeps interned keys only, which it does not keep in memory. Belongs
-// to one thread. Owned by the caller of the decoder.
+// dictionary has a key twice. Keeps interned keys only, because they live as long as the process.
+// Belongs to one thread. Owned by the caller of the decoder.
 class KeyCache {
  public:
   // The front of an entry: the key and the signature of its value.

@@ -10,12 +10,12 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// The arguments behind the first one, as some messages had them lately.
+// The arguments after the first one, of some recent messages.
 //
 // The messages of a session name the same category, type and reporter IDs most of the time. Equal
-// bytes decode to equal values, which are immutable: they are shared instead of decoded. The lists
-// of reporter IDs were two allocations a message. Belongs to one thread. Owned by the caller of the
-// decoder.
+// bytes decode to equal values, which are immutable: they are shared instead of decoded. Decoding
+// the lists of reporter IDs takes two allocations a message. Belongs to one thread. Owned by the
+// caller of the decoder.
 class TailCache {
  public:
   // Longer arguments are decoded.
@@ -31,7 +31,7 @@ class TailCache {
 
   // The values, or null. Valid until the next call of note().
   [[nodiscard]] const std::vector<Value>* find(const Source& source) const;
-  // Keeps the values that were decoded from it.
+  // Keeps the values that were decoded from `source`.
   void note(const Source& source, const Value* begin, const Value* end);
 
  private:

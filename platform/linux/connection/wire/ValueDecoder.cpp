@@ -84,7 +84,7 @@ class Decoder {
 bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& arguments) {
   std::optional<TailCache::Source> tail;
   for (std::string_view rest = types; !rest.empty();) {
-    // Only behind a dictionary: other requests are too small to gain from it.
+    // Only after a dictionary: other requests are too small to gain from it.
     if (scratch_.caches != nullptr && arguments.size() == 1 && arguments.front().isDictionary()) {
       tail = {rest, reader_.rest(), reader_.position(), !reader_.isHostOrder()};
       if (takeKnownTail(*tail, arguments)) return true;

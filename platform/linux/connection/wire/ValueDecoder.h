@@ -34,7 +34,8 @@ struct DecodeError {
   std::string message;
 };
 
-// What earlier bodies had. The result of decoding does not depend on it. Belongs to one thread.
+// What earlier bodies contained. It makes decoding faster and never changes the result. Belongs to
+// one thread.
 struct DecodeCaches {
   KeyCache keys;
   TailCache tails;
@@ -48,7 +49,7 @@ struct DecodeScratch {
   // Without these, each container would be allocated twice.
   std::vector<Value> values{};
   std::vector<Dictionary::Entry> entries{};
-  // For bodies that resemble each other. Null: each is decoded as if it were the first.
+  // For bodies that resemble each other. If null, each body is decoded as if it were the first.
   std::unique_ptr<DecodeCaches> caches{};
   // How many entries the receiver adds to a dictionary that is an argument. The dictionary is made
   // with room for them.

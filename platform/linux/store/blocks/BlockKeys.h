@@ -14,15 +14,15 @@ enum class BlockKeyKind : std::uint8_t {
   kName = 3,         // of an event, or the service of a link message
 };
 
-// 16 bits of a hash. A block with 300 keys seems to have one that it lacks in 1 of 200 cases, and
-// is then read in vain.
+// 16 bits of a hash. A reader that looks for a key that a block of 300 keys lacks seems to find it
+// in 1 of 200 cases, and then reads the block in vain.
 using BlockKey = std::uint16_t;
 [[nodiscard]] BlockKey blockKey(BlockKeyKind kind, std::string_view text);
 [[nodiscard]] BlockKey sessionKey(std::int64_t sessionID);
 
-// The keys of one block, so that a reader who looks for one session or application unpacks only
-// the blocks that have it. A block's row of `message_spans` has them in `keys`, two bytes each with
-// the lower one first, in ascending order.
+// The keys of one block. A reader that looks for one session or application unpacks only the blocks
+// that have its key. A block's row of `message_spans` has them in `keys`, two bytes each with the
+// lower one first, in ascending order.
 // A plain value.
 class BlockKeys {
  public:

@@ -132,7 +132,7 @@ unsigned flagOf(BlockRecordKind kind, const sqlite3_index_info* info, int index)
   }
 }
 
-// Takes one condition for each flag. SQLite tests each row again, so they need not be exact.
+// Takes one condition for each flag. SQLite tests each row again: they need not be exact.
 int chooseIndex(sqlite3_vtab* table, sqlite3_index_info* info) {
   const BlockRecordKind kind = *tableOf(table).kind;
   unsigned flags = 0;
@@ -208,8 +208,8 @@ int advance(sqlite3_vtab_cursor* base) {
   }
 }
 
-// The key of an argument. A value of another type than the column's may still be equal to one after
-// conversion, but has no key.
+// The key of an argument. A value of another type than the column's has none: it may be equal to a
+// value of the column only after conversion.
 std::optional<BlockKey> keyOf(BlockKeyKind kind, sqlite3_value* value) {
   if (kind == BlockKeyKind::kSession) {
     if (sqlite3_value_type(value) != SQLITE_INTEGER) return std::nullopt;

@@ -11,7 +11,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Clients choose names. Past this number they are matched each time.
+// Clients choose names. When this many are remembered, other names are matched each time.
 constexpr std::size_t kMostNames = 4096;
 constexpr std::int64_t kAfterAll = std::numeric_limits<std::int64_t>::max();
 

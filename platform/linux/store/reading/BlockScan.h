@@ -18,7 +18,7 @@ namespace halvox::platform::linux_ {
 
 // One pass over the events or the link messages in blocks that pass a filter. Copies one block at a
 // time and holds no snapshot while its records are used: see StoreReader. Meanwhile the store may
-// join blocks. Numbers do not change, so that the pass meets each record once. The pass ends with
+// join blocks. Numbers do not change: the pass meets each record once. The pass ends with
 // the last record that was stored when it began. Belongs to the thread of its database and does not
 // own its arguments. After an error the scan is over.
 //
@@ -34,8 +34,8 @@ class BlockScan {
   // How many of RecordFilter::newest must come from before all blocks.
   [[nodiscard]] std::uint64_t missing() const { return missing_; }
 
-  // Loads the next block that may have records to read. `found` must be what the call before left
-  // in it, and false for the first one.
+  // Loads the next block that may have records to read, and sets `found`. Pass false to the first
+  // call, and to each later one the value that the call before it set.
   [[nodiscard]] SqliteCode nextBlock(bool& found);
   // Moves to the next record of the block that passes. Its views are valid until the next call.
   [[nodiscard]] bool nextRecord();
@@ -49,7 +49,7 @@ class BlockScan {
   [[nodiscard]] StoredRecordID last() const { return stored_; }
 
  private:
-  // The numbers from `from` to before `to`.
+  // Numbers from `from` up to, but not including, `to`.
   struct Range {
     std::int64_t from;
     std::int64_t to;

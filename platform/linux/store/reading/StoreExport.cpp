@@ -60,7 +60,7 @@ Result<void> StoreExport::create() {
     return Failure<>{part_.native() + ": " + errnoText(errno)};
   }
   std::string sql =
-      // Nothing is lost with the file: an export that fails is deleted.
+      // The file need not survive a crash: an export that fails is deleted.
       "PRAGMA journal_mode = OFF; PRAGMA synchronous = OFF; BEGIN;"
       "CREATE TABLE analytics_events(time REAL NOT NULL, name TEXT NOT NULL, payload TEXT NOT "
       "NULL);";

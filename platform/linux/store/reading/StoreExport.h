@@ -9,8 +9,8 @@
 
 namespace halvox::platform::linux_ {
 
-// A database in which the five names of a store are plain tables with the same columns. Any program
-// that reads SQLite can read it without the store's extension.
+// Writes a database in which the five views of a store are plain tables with the same columns. Any
+// program that reads SQLite can read it without the store's extension.
 //
 //   create(); copyFrom(); finish()
 //
@@ -27,7 +27,7 @@ class StoreExport {
   // Copies the records that pass the filter, of all kinds. Reads as StoreReader does: a service may
   // write meanwhile. Returns why the store cannot be read or the file cannot be written.
   Result<void> copyFrom(StoreReader& reader, const RecordFilter& filter);
-  // Gives the file its name. Replaces a file that has it.
+  // Gives the file its name. Replaces an existing file of that name.
   Result<void> finish();
 
   [[nodiscard]] std::uint64_t records() const { return records_; }
@@ -37,7 +37,7 @@ class StoreExport {
   Result<void> copyKind(std::string_view name, const RecordTable& table, StoreReader& reader,
                         const RecordFilter& filter);
   void insert(Statement& statement);
-  // Returns what became of reading a kind and of writing its rows.
+  // The error of reading a kind or of writing its rows, if there is one.
   [[nodiscard]] Result<void> outcome(const Result<void, StoreError>& read) const;
   [[nodiscard]] Failure<> cannotWrite() const;
 

@@ -21,7 +21,7 @@ namespace halvox::platform::linux_ {
 // tables. Belongs to one thread and one owner.
 //
 // While a statement runs it holds a snapshot, which keeps the service from reusing its write-ahead
-// log. The callbacks must not wait for anything slow, such as a person who reads a page.
+// log. The callbacks must not wait for anything slow, such as the reader of a pager.
 class StoreQueries {
  public:
   // One value of a row; a null is std::monostate. Views are valid during the callback only.
@@ -34,8 +34,8 @@ class StoreQueries {
   Result<void, StoreError> open(const std::filesystem::path& directory);
 
   // Runs the first statement of `sql` and removes it from there. Calls `columns` before the first
-  // row, also if there is none. Returns why the statement cannot be run; the rows before an error
-  // have been delivered. Blanks and comments alone are not an error.
+  // row, even if there are no rows. Returns why the statement cannot be run; the rows before an
+  // error have been delivered. Blanks and comments alone are not an error.
   Result<void> runFirst(std::string_view& sql, const ColumnsCallback& columns,
                         const RowCallback& row);
 

@@ -150,7 +150,7 @@ SqliteCode StoreReader::readOldEvents(const RecordFilter& filter, const EventCal
       callback({event.id, event.time, scan.nameOf(event.nameID), piece.payloads[event.payload]});
     }
   }
-  // An empty table's last event would be the twin of record 0, which has the number of a message.
+  // For an empty table last() is 1, which is also the number of a record in a block.
   if (code == SQLITE_OK && scan.last() > 1) lastRead_ = scan.last();
   return code;
 }
