@@ -189,8 +189,8 @@ void HVReportingClientServerInstance::postMessage(platform::Message message,
                      senderProcessName(type, sender), std::move(request), std::move(charge)});
 }
 
-// One job for all messages that one read of the socket gave. A job for each, with its token and its
-// reply, were six allocations a message.
+// One job for all messages that one read of the socket gave. A job for each message, with its token
+// and its reply, takes six allocations.
 void HVReportingClientServerInstance::endOfRequests() {
   if (posted_.empty()) return;
   reportingQueue()->async(platform::JobWeight::kBrief,
@@ -203,14 +203,14 @@ void HVReportingClientServerInstance::endOfRequests() {
 void HVReportingClientServerInstance::carryOutSends(Messages& messages) {
   std::exception_ptr failure;
   for (MessageRequest& message : messages) {
-    // Releases each message as soon as it has been sent: the client's next requests are read only
-    // while few are open.
+    // Release each message as soon as it is sent: the client's next requests are read only while
+    // few are open.
     MessageRequest request = std::move(message);
     try {
       carryOutSend(request);
       counters_->requests.carriedOut.add();
     } catch (...) {
-      // The queue logs it. It must not cost the other messages.
+      // The queue logs it. The other messages of the job are sent all the same.
       failure = std::current_exception();
     }
   }

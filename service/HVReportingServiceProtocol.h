@@ -53,8 +53,8 @@ class HVReportingServiceProtocol : public platform::ExportedObject {
   virtual void sendMessage(platform::Message message, AudioEventCategory category,
                            AudioEventType type, ReporterIDs reporterIDs, ErrorReply reply,
                            RequestContext context) = 0;
-  // Does the same for a request of a connection, whose arguments need no copy. The work is queued
-  // at endOfRequests(), or before another request: the messages of one read are one job.
+  // Does the same for a request of a connection, whose arguments need no copy. Queues the work at
+  // endOfRequests(), or before another request: the messages of one read become one job.
   virtual void postMessage(platform::Message message, AudioEventCategory category,
                            AudioEventType type, std::optional<platform::Array> reporterIDs,
                            platform::PostedRequest request, platform::ProcessID sender) = 0;

@@ -15,15 +15,16 @@ using platform::Value;
 using platform::ValueKind;
 
 // The low four bits of a value's first byte. The high four bits hold the NumberKind of an integer,
-// or how many bytes of a difference are left out because they are zero.
+// or the number of zero bytes that are omitted from a difference.
 enum Tag : std::uint8_t {
   kNone,
   kInteger,
-  // A difference of bits whose zero bytes are the highest ones, as those of close time stamps are.
+  // A difference of bits without its highest bytes, which are zero. Close time stamps differ by
+  // such numbers.
   kFloat,
   kDouble,
   kDate,
-  // The same for zero bytes that are the lowest ones, as those of short fractions are.
+  // The same without its lowest bytes, which are zero for short fractions.
   kFloatShiftedUp,
   kDoubleShiftedUp,
   kDateShiftedUp,
@@ -37,8 +38,8 @@ constexpr unsigned kTagBits = 4;
 constexpr unsigned kBitsOfByte = 8;
 constexpr unsigned kBytesOfBits = 8;
 constexpr std::uint64_t kByteMask = 0xFF;
-// Of containers within containers. The wire carries far less deep ones; a client's message cannot
-// reach this.
+// The levels of containers within containers. A client's message has at most those that the wire
+// allows, which are far fewer.
 constexpr unsigned kMaxDepth = 256;
 constexpr unsigned kToShiftedUp = kFloatShiftedUp - kFloat;
 
@@ -68,7 +69,7 @@ std::uint64_t bitsBefore(const Value& previous) {
 }
 
 // Puts the sign into the lowest bit, so that small negative differences are short too. All
-// arithmetic wraps around, hence any two numbers have a difference.
+// arithmetic wraps around: any two numbers have a difference.
 std::uint64_t zigzag(std::uint64_t difference) {
   const std::uint64_t sign = (difference >> 63U) != 0 ? ~std::uint64_t{0} : 0;
   return (difference << 1U) ^ sign;

@@ -11,9 +11,8 @@
 // How a history writes values: each as its difference from the value that the same key had before.
 // Most values of a message repeat or grow a little, so most differences take one to three bytes.
 //
-// The bytes are for this process only, which reads them back itself. They may have been on a disk
-// meanwhile, hence a reader does not trust them. A value is read as it was written, down to the
-// type of its numbers.
+// Only this process reads the bytes. It does not trust them, because they may have been on a disk
+// meanwhile. A value is read as it was written, down to the type of its numbers.
 namespace halvox {
 
 // True if a history need not write `value` again after `previous`: both have the same type and the
@@ -45,9 +44,9 @@ class CompactWriter {
   std::vector<std::byte>& bytes_;
 };
 
-// Reads what a CompactWriter wrote, in the same order. After bytes that no CompactWriter writes it
-// is not intact, and everything that it reads is zero or empty. The bytes must outlive it. Belongs
-// to one thread.
+// Reads what a CompactWriter wrote, in the same order. At bytes that no CompactWriter writes the
+// reader stops being intact. Everything that it reads from then on is zero or empty. The bytes must
+// outlive it. Belongs to one thread.
 class CompactReader {
  public:
   explicit CompactReader(std::span<const std::byte> bytes) : bytes_(bytes) {}
@@ -56,16 +55,17 @@ class CompactReader {
   [[nodiscard]] bool isAtEnd() const { return position_ == bytes_.size(); }
   [[nodiscard]] std::size_t position() const { return position_; }
   std::uint64_t number();
-  // The number of things that follow. Each takes a byte or more: a number that is larger than what
-  // is left is not intact. The caller may reserve memory for them.
+  // The number of things that follow. Each takes at least a byte: after a number larger than the
+  // remaining bytes the reader is not intact, and 0 is returned. The caller may therefore reserve
+  // memory for them.
   std::size_t count();
-  // Both are valid as long as the bytes.
+  // The results of both are valid as long as the bytes.
   std::span<const std::byte> bytes(std::size_t length);
   std::string_view text();
   platform::Value value(const platform::Value& previous);
   // Entries with their keys.
   platform::Dictionary dictionary();
-  // From now on the reader is not intact: what it read has no meaning to the caller.
+  // Makes the reader not intact. For a caller to whom the bytes make no sense.
   void giveUp();
 
  private:

@@ -5,8 +5,8 @@
 namespace halvox {
 namespace {
 
-// Large enough that moving a piece out costs little more than copying its bytes, and small beside
-// what one session may hold.
+// Large enough that moving a piece out costs little more than copying its bytes, and small compared
+// with what one session may hold.
 constexpr std::size_t kPieceBytes = 64 * 1024;
 // An entry of a message seldom takes more. A piece that has less room left is full.
 constexpr std::size_t kRoomForEntry = 512;

@@ -28,7 +28,7 @@ class HistoryBytes {
   HistoryBytes& operator=(const HistoryBytes&) = delete;
   ~HistoryBytes();
 
-  // Where the next entry is to be appended. An entry lies in one piece.
+  // The piece to which the next entry must be appended. An entry is never split.
   [[nodiscard]] std::vector<std::byte>& last();
 
   [[nodiscard]] std::size_t pieces() const { return pieces_.size(); }
@@ -49,9 +49,9 @@ class HistoryBytes {
   [[nodiscard]] std::size_t memorySize() const {
     return movableSize() + pieces_.size() * sizeof(Piece);
   }
-  // The part of these that can be moved out.
+  // The part of memorySize() that can be moved out.
   [[nodiscard]] std::size_t movableSize() const { return fullInMemory_ + lastCapacity(); }
-  // Moves all pieces out of memory. After an error the remaining ones are still there.
+  // Moves all pieces out of memory. After an error the remaining ones are still in memory.
   [[nodiscard]] std::optional<platform::Error> moveOut();
 
  private:

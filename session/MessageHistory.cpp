@@ -69,7 +69,7 @@ bool haveSameKeys(const Dictionary& left, const Dictionary& right) {
                     });
 }
 
-// The bytes of a bit for each of the keys.
+// How many bytes a bit for each of the keys takes.
 std::size_t maskSizeFor(std::size_t keys) { return (keys + kBitsOfByte - 1) / kBitsOfByte; }
 
 // The keys of a message without their values.

@@ -23,7 +23,7 @@ namespace halvox {
 //
 // Each message has an identifier "base_n": the base names the category and the type, and n counts
 // the accepted messages of that base from 1. The newest message of each base is kept as it came,
-// because the next one is compared with it; the time for a message does not grow with the history.
+// because the next one is compared with it. The time for a message does not grow with the history.
 //
 // All messages are kept compactly, as bytes. Messages of one base usually have the same keys: such
 // a sequence of keys is a form, and a message is written as its difference from the previous
@@ -48,7 +48,7 @@ class MessageHistory {
     std::uint64_t count_ = 0;
     std::uint64_t lost_ = 0;            // messages that were counted since the last recorded one
     std::vector<std::uint32_t> forms_;  // positions in forms_, the one used last in front
-    // If true, the newest message is the previous one of the form in front. Otherwise it is here.
+    // If true, the newest message is `previous` of the form in front. Otherwise it is in newest_.
     bool isNewestInForm_ = false;
     platform::Dictionary newest_;
     std::size_t newestSize_ = 0;  // in memory
@@ -67,9 +67,9 @@ class MessageHistory {
     const platform::Dictionary* message_ = nullptr;  // owned by the reader
   };
 
-  // Reads the messages of a history from the first one on, and goes on with those that are added
-  // meanwhile. The history must stay where it is. Belongs to one thread, which holds the history's
-  // lock during each call.
+  // Reads the messages of a history from the first one on, including those that are added during
+  // the reading. The history must stay where it is. Belongs to one thread, which holds the
+  // history's lock during each call.
   class Reader {
    public:
     explicit Reader(const MessageHistory& history) : history_(&history) {}
@@ -124,13 +124,13 @@ class MessageHistory {
   [[nodiscard]] const platform::Dictionary* newestMessage(const Base& base) const;
   // Adds a message under the next identifier of the base.
   void append(Base& base, platform::Dictionary message);
-  // Counts a message under the next identifier of the base and compares the next one with it, but
-  // does not keep it: for want of room.
+  // Does not keep the message, because there is no room. Counts it under the next identifier of the
+  // base. The next message of the base is compared with it.
   void lose(Base& base, platform::Dictionary message);
 
   // The bytes that the history keeps in memory. Constant time.
   [[nodiscard]] std::size_t memorySize() const { return memorySize_ + bytes_.memorySize(); }
-  // The part of these that can be moved out.
+  // The part of memorySize() that can be moved out.
   [[nodiscard]] std::size_t movableSize() const { return bytes_.movableSize(); }
   // Moves what was recorded out of memory. After an error the history is as it was.
   [[nodiscard]] std::optional<platform::Error> moveOut() { return bytes_.moveOut(); }

@@ -63,8 +63,8 @@ SessionHistory::Outcome SessionHistory::recordLocked(const Lock& history,
   return outcome;
 }
 
-// A history never refuses a message: when it takes much memory, it goes on in a file. Only the disk
-// limits it. A loss is logged once in a run, because a full disk stays full for many messages.
+// When a history takes much memory, it goes on in a file. Only a full disk makes it lose a message.
+// A loss is logged once in a run, because a full disk stays full for many messages.
 bool SessionHistory::makeRoom(MessageHistory& messages) const {
   const std::size_t movable = messages.movableSize();
   if (movable < kLeastToMove) return true;

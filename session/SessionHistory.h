@@ -16,7 +16,7 @@ namespace halvox {
 // messages are not recorded.
 //
 // A history that takes much memory goes on outside memory. If that fails, for instance because the
-// disk is full, it loses messages, which it logs, until there is room again.
+// disk is full, it loses messages until there is room again, and logs the first loss of a run.
 //
 // Owned by the session. Any thread may call; the history has one lock, which also guards the
 // counts of its identifiers.
@@ -25,7 +25,7 @@ class SessionHistory {
   // The history, locked. Holds none outside a run.
   using Lock = Guarded<std::optional<MessageHistory>>::Lock;
 
-  // What became of a message. kNoRoom: it would have been recorded.
+  // What became of a message. kNoRoom: it was lost, but otherwise treated as a recorded one.
   enum class Outcome : std::uint8_t { kRecorded, kRedundant, kNotStarted, kNoRoom };
 
   // Charges the history to `held`, which must outlive this.

@@ -37,7 +37,8 @@ void SummaryEvent::add(const Dictionary& message) {
   }
 }
 
-// Most values of a session repeat the one before. Copying its text costs less than making it again.
+// Most values of a session repeat the previous one. Copying its text costs less than making it
+// again.
 void SummaryEvent::append(Column& column, const Value& value) {
   const std::size_t begin = column.text.size();
   if (begin > 0 && column.last.isIdenticalTo(value)) {

@@ -49,8 +49,8 @@ class VolumeIntervals {
   std::optional<double> start_;  // in seconds; none while no interval is open
 };
 
-// Finds the volume messages of a history one at a time, so that the history need not stay locked
-// between them. Messages that are added during the walk are ignored: the session records each
+// Finds the volume messages of a history one at a time. The history need not stay locked between
+// them. Messages that are added during the walk are ignored, because the session records each
 // volume message in the same history.
 //
 // Belongs to one thread, which holds the lock of the history during each call of next(). The

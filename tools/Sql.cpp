@@ -20,7 +20,7 @@ namespace {
 using platform::linux_::StoreQueries;
 using Value = StoreQueries::Value;
 
-// The text of the rows of one statement, in a file without a name. A result may be larger than
+// The text of the rows of one statement, in a file without a name: a result may be larger than
 // memory.
 class Spool {
  public:
@@ -67,7 +67,7 @@ std::string textOf(const Value& value, OutputForm form) {
         } else if constexpr (std::is_same_v<Content, double>) {
           return isJson ? toJson(content) : shortNumber(content);
         } else if constexpr (std::is_same_v<Content, std::string_view>) {
-          // Clients choose texts, which could otherwise control the terminal.
+          // Clients choose the texts. Escape sequences in them must not reach the terminal.
           return isJson ? harmlessJson(tools::quoted(content)) : harmlessText(content);
         } else {
           return isJson ? tools::quoted(hexadecimal(content)) : hexadecimal(content);

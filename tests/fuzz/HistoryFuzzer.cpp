@@ -1,5 +1,6 @@
-// Feeds hostile bytes to the reader of a history, as a damaged disk would after the history went on
-// in a file. The bytes are read as a list of values and as the messages of a history.
+// Feeds hostile bytes to the reader of a history, like those that a damaged disk returns for a
+// history that went on in a file. The bytes are read as a list of values and as the messages of a
+// history.
 
 #include <algorithm>
 #include <cstddef>
@@ -27,7 +28,7 @@ void require(bool condition) {
   if (!condition) std::abort();
 }
 
-// What was written is read as the bytes of this run.
+// Whatever was written, reading returns the bytes of this run.
 class BytesOverflowService final : public platform::OverflowService {
  public:
   void setBytes(std::span<const std::byte> bytes) { bytes_.assign(bytes.begin(), bytes.end()); }

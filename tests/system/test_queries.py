@@ -82,7 +82,7 @@ class QueriesTest(unittest.TestCase):
             stdout=subprocess.PIPE, env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
         self.addCleanup(slow.wait, DEADLINE)
         self.addCleanup(slow.stdout.close)
-        # Its first line comes when the statement has ended. It then waits for us to read the rest.
+        # The first line comes when the statement has ended. halvoxctl then waits until the rest is read.
         slow.stdout.readline()
 
         def log_is_copied_whole():

@@ -16,8 +16,7 @@ void addTimes(CLI::App& app, std::optional<double>& since, std::optional<double>
 // Adds --database.
 void addDatabase(CLI::App& app, std::string& database);
 // Adds the options that all commands for stored records share: --since, --until, --last, --follow
-// and
-// --database. If `names` is not null, it is the name of an option for the names of the records.
+// and --database. If `names` is not null, it is the name of an option for the names of the records.
 // `records` is the word for the records in the help. The options are parsed into `selection`.
 void addSelection(CLI::App& app, RecordSelection& selection, const char* records,
                   const char* names);
