@@ -27,7 +27,7 @@ namespace halvox {
 //
 // All messages are kept compactly, as bytes. Messages of one base usually have the same keys: such
 // a sequence of keys is a form, and a message is written as its difference from the previous
-// message of its form. A message of ten fields, three of which change, takes about 15 bytes; as
+// message of its form. A message of ten fields, three of which change, takes about 20 bytes; as
 // values it would take 460. The bytes can be moved out of memory.
 //
 // Owned by the session's SessionHistory, whose lock guards it.
