@@ -13,42 +13,22 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
-#include "client/testing/TestService.h"
-#include "platform/fake/FakePlatform.h"
 #include "platform/linux/base/UniqueHandle.h"
-#include "platform/linux/store/SqliteAnalyticsService.h"
-#include "platform/linux/store/SqliteStore.h"
+#include "tools/StoredEventsFixture.h"
 
 namespace halvox::tools {
 namespace {
 
-using platform::linux_::Backpressure;
-using platform::linux_::SqliteAnalyticsService;
-using platform::linux_::SqliteStore;
 using platform::linux_::StoredEvent;
-using platform::linux_::StoreOptions;
 using platform::linux_::UniqueFd;
 
-// Writes events into a store of its own: one a second, from 100 seconds after 1970 on.
-class EventsTest : public testing::Test {
+class EventsTest : public StoredEventsFixture {
  protected:
   EventsTest() {
     setenv("TZ", "UTC", 1);
     tzset();
-    StoreOptions options;
-    options.directory = scratch_.path("state");
-    options.retentionDays = 1'000'000;  // these events are old
-    store_ = std::make_unique<SqliteStore>(
-        options, SqliteStore::Environment{platform_.clock, platform_.statistics, backpressure_});
-    EXPECT_TRUE(store_->open());
-    service_ = std::make_unique<SqliteAnalyticsService>(*store_, platform_.clock);
   }
 
-  void store(const std::string& name, const platform::Dictionary& payload) {
-    platform_.clock.setCurrentDate({time_++});
-    service_->sendAnalyticsEventLazy(name, [payload] { return payload; });
-    EXPECT_TRUE(client::eventually([this] { return store_->waiting() == 0; }));
-  }
   void storeSome() {
     store("com.a.first", {{"n", 1}});
     store("com.b.second", {{"n", 2}});
@@ -57,7 +37,7 @@ class EventsTest : public testing::Test {
   }
   // The field n of the events shown, in their order.
   std::string shown(RecordSelection request) {
-    request.database = scratch_.path("state");
+    request.database = directory();
     std::ostringstream out;
     EXPECT_EQ(showEvents(request, OutputForm::kText, out, -1, errors_), ExitStatus::kDone);
     std::string numbers;
@@ -66,13 +46,7 @@ class EventsTest : public testing::Test {
     return numbers;
   }
 
-  client::ScratchDirectory scratch_;
-  platform::FakePlatform platform_;
-  Backpressure backpressure_;
-  std::unique_ptr<SqliteStore> store_;
-  std::unique_ptr<SqliteAnalyticsService> service_;
   std::ostringstream errors_;
-  double time_ = 100;
 };
 
 TEST_F(EventsTest, ShowsEventsNewestLast) {
@@ -143,7 +117,7 @@ TEST_F(EventsTest, ABadConfigurationHasItsOwnStatus) {
 TEST_F(EventsTest, TheConfigurationNamesTheStore) {
   store("com.a.first", {{"n", 1}});
   const std::string configuration = scratch_.path("halvox.toml");
-  std::ofstream(configuration) << "[storage]\ndirectory = \"" << scratch_.path("state") << "\"\n";
+  std::ofstream(configuration) << "[storage]\ndirectory = \"" << directory() << "\"\n";
   setenv("HALVOX_CONFIG", configuration.c_str(), 1);
   std::ostringstream out;
 
@@ -165,7 +139,7 @@ TEST_F(EventsTest, FollowingShowsNewEventsUntilTheOutputIsClosed) {
     std::ofstream out(pipePath);
     RecordSelection request;
     request.follow = true;
-    request.database = scratch_.path("state");
+    request.database = directory();
     status = static_cast<int>(showEvents(request, OutputForm::kText, out, writeEnd.get(), errors_));
   });
 

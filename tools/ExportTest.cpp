@@ -8,39 +8,23 @@
 
 #include <gmock/gmock.h>
 
-#include "client/testing/TestService.h"
-#include "platform/fake/FakePlatform.h"
-#include "platform/linux/store/SqliteAnalyticsService.h"
-#include "platform/linux/store/SqliteStore.h"
+#include "tools/StoredEventsFixture.h"
 
 namespace halvox::tools {
 namespace {
 
-using platform::linux_::Backpressure;
-using platform::linux_::SqliteAnalyticsService;
-using platform::linux_::SqliteStore;
-using platform::linux_::StoreOptions;
 using ::testing::HasSubstr;
 
-class ExportTest : public testing::Test {
+class ExportTest : public StoredEventsFixture {
  protected:
-  ExportTest() {
-    StoreOptions options;
-    options.directory = scratch_.path("state");
-    store_ = std::make_unique<SqliteStore>(
-        options, SqliteStore::Environment{platform_.clock, platform_.statistics, backpressure_});
-    EXPECT_TRUE(store_->open());
-    SqliteAnalyticsService service(*store_, platform_.clock);
-    service.sendAnalyticsEventLazy("com.a", [] { return platform::Dictionary{{"n", 1}}; });
-    EXPECT_TRUE(client::eventually([this] { return store_->waiting() == 0; }));
-  }
+  ExportTest() { store("com.a", {{"n", 1}}); }
 
   ExitStatus run(bool replace = false) {
     output_.str("");
     errors_.str("");
     std::istringstream none;
-    return exportRecords({.to = file(), .replace = replace, .database = scratch_.path("state")},
-                         options_, {none, output_, errors_});
+    return exportRecords({.to = file(), .replace = replace, .database = directory()}, options_,
+                         {none, output_, errors_});
   }
   [[nodiscard]] std::string file() const { return scratch_.path("plain.db"); }
   [[nodiscard]] std::string output() const { return output_.str(); }
@@ -49,10 +33,6 @@ class ExportTest : public testing::Test {
   CommonOptions options_;
 
  private:
-  client::ScratchDirectory scratch_;
-  platform::FakePlatform platform_;
-  Backpressure backpressure_;
-  std::unique_ptr<SqliteStore> store_;
   std::ostringstream output_;
   std::ostringstream errors_;
 };

@@ -6,45 +6,25 @@
 
 #include <gmock/gmock.h>
 
-#include "client/testing/TestService.h"
-#include "platform/fake/FakePlatform.h"
-#include "platform/linux/store/SqliteAnalyticsService.h"
-#include "platform/linux/store/SqliteStore.h"
+#include "tools/StoredEventsFixture.h"
 
 namespace halvox::tools {
 namespace {
 
-using platform::linux_::Backpressure;
-using platform::linux_::SqliteAnalyticsService;
-using platform::linux_::SqliteStore;
-using platform::linux_::StoreOptions;
 using ::testing::HasSubstr;
 
 // A store with two events, 100 and 101 seconds after 1970.
-class SqlTest : public testing::Test {
+class SqlTest : public StoredEventsFixture {
  protected:
   SqlTest() {
-    StoreOptions options;
-    options.directory = scratch_.path("state");
-    options.retentionDays = 1'000'000;  // these events are old
-    store_ = std::make_unique<SqliteStore>(
-        options, SqliteStore::Environment{platform_.clock, platform_.statistics, backpressure_});
-    EXPECT_TRUE(store_->open());
-    SqliteAnalyticsService service(*store_, platform_.clock);
-    for (int number = 0; number < 2; ++number) {
-      platform_.clock.setCurrentDate({100.0 + number});
-      service.sendAnalyticsEventLazy("com.a\x1b[2J", [number] {
-        return platform::Dictionary{{"n", number}};
-      });
-    }
-    EXPECT_TRUE(client::eventually([this] { return store_->waiting() == 0; }));
+    for (int number = 0; number < 2; ++number) store("com.a\x1b[2J", {{"n", number}});
   }
 
   ExitStatus run(const std::string& query, const std::string& input = "", bool isTerminal = false) {
     output_.str("");
     errors_.str("");
     std::istringstream stream(input);
-    return runSql({.query = query, .database = scratch_.path("state")}, options_,
+    return runSql({.query = query, .database = directory()}, options_,
                   {stream, output_, errors_, -1, isTerminal});
   }
   [[nodiscard]] std::string output() const { return output_.str(); }
@@ -53,10 +33,6 @@ class SqlTest : public testing::Test {
   CommonOptions options_;
 
  private:
-  client::ScratchDirectory scratch_;
-  platform::FakePlatform platform_;
-  Backpressure backpressure_;
-  std::unique_ptr<SqliteStore> store_;
   std::ostringstream output_;
   std::ostringstream errors_;
 };

@@ -1,13 +1,17 @@
 #include "bench/client/SinkServer.h"
 
+#include <chrono>
+#include <csignal>
 #include <cstdint>
 #include <cstring>
 #include <string_view>
+#include <thread>
 #include <vector>
 
 #include <poll.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 namespace halvox::bench {
@@ -130,6 +134,18 @@ int serveSink(const std::string& socketPath) {
     }
     close(fd);
   }
+}
+
+SinkProcess::SinkProcess(const std::string& socketPath) : child_(fork()) {
+  if (child_ == 0) _exit(serveSink(socketPath));
+  while (access(socketPath.c_str(), F_OK) != 0) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(1));
+  }
+}
+
+SinkProcess::~SinkProcess() {
+  kill(child_, SIGKILL);
+  waitpid(child_, nullptr, 0);
 }
 
 }  // namespace halvox::bench

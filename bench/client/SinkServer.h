@@ -2,6 +2,8 @@
 
 #include <string>
 
+#include <sys/types.h>
+
 namespace halvox::bench {
 
 // A server that does the least for each request: reads frames, skips them by their length, and
@@ -9,5 +11,18 @@ namespace halvox::bench {
 // the service or the client library. Serves one connection after another, on the calling thread,
 // until a signal ends the process. Returns 1 if it cannot listen.
 int serveSink(const std::string& socketPath);
+
+// Such a server in a process of its own, which ends with this object. Make it before the first
+// thread, because it forks. The constructor waits until the server listens.
+class SinkProcess {
+ public:
+  explicit SinkProcess(const std::string& socketPath);
+  ~SinkProcess();
+  SinkProcess(const SinkProcess&) = delete;
+  SinkProcess& operator=(const SinkProcess&) = delete;
+
+ private:
+  pid_t child_;
+};
 
 }  // namespace halvox::bench

@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <array>
 #include <chrono>
-#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -356,26 +355,6 @@ double loadAverage() {
   return getloadavg(&load, 1) == 1 ? load : -1;
 }
 
-// The server, in a process that ends with this one.
-class Sink {
- public:
-  explicit Sink(const std::string& socketPath) : child_(fork()) {
-    if (child_ == 0) _exit(halvox::bench::serveSink(socketPath));
-    while (access(socketPath.c_str(), F_OK) != 0) {
-      std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
-  }
-  ~Sink() {
-    kill(child_, SIGKILL);
-    waitpid(child_, nullptr, 0);
-  }
-  Sink(const Sink&) = delete;
-  Sink& operator=(const Sink&) = delete;
-
- private:
-  pid_t child_;
-};
-
 bool isChosen(int argc, char** argv, std::string_view name) {
   return argc == 1 || std::find(argv + 1, argv + argc, name) != argv + argc;
 }
@@ -388,7 +367,7 @@ int main(int argc, char** argv) {
     constexpr int kRounds = 5;
     const halvox::platform::linux_::ScratchDirectory scratch;
     const std::string socketPath = scratch.path("sink");
-    const Sink sink(socketPath);
+    const halvox::bench::SinkProcess sink(socketPath);
     std::printf("load average before: %.1f\n", loadAverage());
     if (isChosen(argc, argv, "pipelined")) printPipelined(socketPath, 300'000, kRounds);
     if (isChosen(argc, argv, "caller")) printCaller(socketPath, 40'000, kRounds);

@@ -3,7 +3,6 @@
 // the least. The kinds take turns in every round; the result is the median of the rounds.
 
 #include <chrono>
-#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <exception>
@@ -16,8 +15,6 @@
 #include <vector>
 
 #include <CLI/CLI.hpp>
-#include <sys/wait.h>
-#include <unistd.h>
 
 #include "bench/client/RawClient.h"
 #include "bench/client/SinkServer.h"
@@ -196,30 +193,10 @@ void compareCosts(const Options& options) {
   }
 }
 
-// A bare reader of the same frames, in a process that ends with this object.
-class Sink {
- public:
-  explicit Sink(const std::string& socket) : child_(fork()) {
-    if (child_ == 0) _exit(serveSink(socket));
-    while (access(socket.c_str(), F_OK) != 0) {
-      std::this_thread::sleep_for(std::chrono::milliseconds(1));
-    }
-  }
-  ~Sink() {
-    kill(child_, SIGKILL);
-    waitpid(child_, nullptr, 0);
-  }
-  Sink(const Sink&) = delete;
-  Sink& operator=(const Sink&) = delete;
-
- private:
-  pid_t child_;
-};
-
 void compareLatency(const Options& options) {
   constexpr int kPings = 4000;
   const platform::linux_::ScratchDirectory scratch;
-  const Sink sink(scratch.path("sink"));
+  const SinkProcess sink(scratch.path("sink"));
   const Service service(options, "");
   std::vector<double> p50[2];
   std::vector<double> p99[2];
