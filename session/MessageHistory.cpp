@@ -236,9 +236,9 @@ std::span<const std::byte> MessageHistory::Reader::restOfPiece() {
 }
 
 void MessageHistory::Reader::giveUp() {
-  error_ = platform::Error{.description = "the bytes " + std::to_string(position_) +
-                                          " and on of piece " + std::to_string(piece_) +
-                                          " are not what was written there"};
+  error_ = platform::Error{.description = "piece " + std::to_string(piece_) +
+                                          " of the history is damaged from byte " +
+                                          std::to_string(position_) + " on"};
 }
 
 // Returns true if the entry was a message. If the bytes are damaged, what it returns or sets has no

@@ -195,7 +195,8 @@ TEST_F(MessageHistoryOverflowTest, AHistoryWhoseBytesAreDamagedEndsBeforeTheDama
   EXPECT_EQ(first->message(), (Dictionary{{"number", 1}}));
   EXPECT_EQ(reader.next(), nullptr);
   ASSERT_TRUE(reader.error().has_value());
-  EXPECT_THAT(reader.error()->description, HasSubstr("bytes 4 and on of piece 0"));
+  EXPECT_THAT(reader.error()->description,
+              HasSubstr("piece 0 of the history is damaged from byte 4 on"));
 }
 
 // What a base's newest message is does not depend on how it was kept.

@@ -71,8 +71,8 @@ bool SessionHistory::makeRoom(MessageHistory& messages) const {
   if (movable < kMostInMemory && !isClientOverItsShare()) return true;
   const auto error = messages.moveOut();
   if (error.has_value() && messages.lost() == 0) {
-    kSessionLog.error("the history of a session loses messages, and its summary will lack them, ",
-                      "until there is room for it: ", error->description);
+    kSessionLog.error("cannot move the history of a session out of memory: ", error->description,
+                      "; its messages are missing from the summary until there is room");
   }
   return !error.has_value();
 }

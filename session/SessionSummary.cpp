@@ -86,9 +86,9 @@ void SessionSummary::writeFile() const {
 
 void SessionSummary::logIfCutShort(const MessageHistory::Reader& reader) const {
   if (!reader.error().has_value()) return;
-  kSessionLog.error("the history of reporter ", number(profile_.reporterID()),
-                    " cannot be read to its end, the summary has only what precedes: ",
-                    reader.error()->description);
+  kSessionLog.error("cannot read the rest of the history of reporter ",
+                    number(profile_.reporterID()), ": ", reader.error()->description,
+                    "; the summary lacks the remaining messages");
 }
 
 std::string SessionSummary::fileName() const {
