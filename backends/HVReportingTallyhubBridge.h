@@ -20,8 +20,8 @@ class HVReportingTallyhubBridge {
   //
   // The payload is a copy of the message (empty without a message) with the name of the application
   // from the session's configuration. The analytics service builds it later, possibly on another
-  // thread, so each event holds the message and the session, and a configuration that changed
-  // meanwhile is seen in its new state.
+  // thread. Each event therefore holds the message and the session, and a configuration that
+  // changed meanwhile is seen in its new state.
   static void handleEvent(const platform::Message& message, AudioEventCategory category,
                           AudioEventType type, const std::shared_ptr<HVReportingSession>& session);
 };

@@ -19,7 +19,7 @@ std::string bucket(const Value& number, const Array& buckets, const Value& digit
   return HVReportingUtilityBucketNumberToString(number, buckets, digits).value_or("none");
 }
 
-// A single bucket is always chosen, so this returns how it is formatted.
+// A single bucket is always chosen: this returns how it is formatted.
 std::string written(const Value& only, const Value& digits) { return bucket(0, {only}, digits); }
 
 // --- Rounding -----------------------------------------------------------------------------------

@@ -80,7 +80,7 @@ TEST_F(HVReportingInternalBuildAnswerTest, ConcurrentFirstCallsAskTheDeviceOnce)
   EXPECT_EQ(platform_.deviceProperties.queries(), 1U);
 }
 
-// A process gets its answer only once, so each of these tests runs in a process of its own. No test
+// A process gets its answer only once. Each of these tests runs in a process of its own. No test
 // may call the function in the test program itself.
 
 // Exits with a sum: 1 if the first answer was yes, 2 if the second was, and 4 for each query.

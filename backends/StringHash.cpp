@@ -152,7 +152,7 @@ struct State {
 
 std::uint64_t hashLong(std::string_view text) {
   State state(text);
-  // The constructor has used the last bytes, so the last block is skipped here.
+  // The constructor has used the last bytes: skip the last block here.
   for (std::size_t offset = 0; offset + kBlock < text.size(); offset += kBlock) {
     state.take(text, offset);
   }

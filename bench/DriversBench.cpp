@@ -138,7 +138,7 @@ void measureQueue(const Sampler& sampler, const std::filesystem::path& directory
       sessions.push_back(sampler.snapShot());
       snapShots.push_back(milliseconds(Clock::now() - start));
     }
-    // All files change, so the first report has to read them again.
+    // All files change: the first report has to read them again.
     writeFiles(directory, round + 2);
     for (const SnapShot& session : sessions) {
       const auto start = Clock::now();

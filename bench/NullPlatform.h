@@ -86,7 +86,7 @@ class ListQueue final : public platform::DispatchQueue {
   std::deque<platform::Job>& jobs_;  // owned by the ListDispatch
 };
 
-// A wait would hang the only thread, so it ends the program.
+// A wait would hang the only thread. It therefore ends the program.
 class NullSemaphore final : public platform::DispatchSemaphore {
  public:
   void signal() override {}

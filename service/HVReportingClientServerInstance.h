@@ -25,7 +25,7 @@ namespace halvox {
 //
 // Requests arrive on the connection's thread, which only queues them. The work runs on the
 // reporting queue, which also owns the map of sessions. Shared by its connection, by the delegate
-// while it is registered, and by its queued requests, so it is always held by a shared pointer. No
+// while it is registered, and by its queued requests: it is always held by a shared pointer. No
 // operation fails: a request about an unknown session is answered without an error.
 class HVReportingClientServerInstance final
     : public HVReportingServiceProtocol,

@@ -38,7 +38,7 @@ class ReporterIDsDescription {
 
 // Adds the time of arrival to the message. Removes what the client sent under these keys first, so
 // that the stamps become the last entries. Sessions replace blanks in keys and keep the later of
-// two equal keys, so a client's "systemuptime sec" does not displace a stamp.
+// two equal keys: a client's "systemuptime sec" does not displace a stamp.
 void stamp(platform::Message& message) {
   static const platform::Key timestamp("hvreporting_timestamp");
   static const platform::Key systemUptime("systemuptime_sec");

@@ -135,7 +135,7 @@ void HVReportingClientServerInstance::begin(const Session& session, const Delega
   counters_->startReplies.heldBack.add();
   session->setTransactionCompleteBlock(reply);
   sendFeaturesState(*session, delegate);
-  // A test gets its reply at once. The reply also stays stored, so it is called again when the
+  // A test gets its reply at once. The reply also stays stored, and is called again when the
   // session is stopped; this is required.
   if (isTracingTest(*session)) reply(std::nullopt, true);
   logActiveSessions(delegate);

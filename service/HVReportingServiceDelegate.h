@@ -113,7 +113,7 @@ class HVReportingServiceDelegate final
   // Null on builds that are not internal. Reporting queue only.
   std::unique_ptr<HVReportingUtilityVEKStateManager> vekStateManager_;
   // Expires with this object. The handlers that refer to it are registered for the life of the
-  // process, so they check this first.
+  // process: they check this first.
   const std::shared_ptr<const bool> alive_ = std::make_shared<bool>(true);
 };
 

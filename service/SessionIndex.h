@@ -13,7 +13,7 @@ namespace halvox {
 // Finds sessions across all registered clients. Gives the answers of a walk over the clients in the
 // order of their registration, without the walk: every message needs them.
 //
-// Owned by the delegate; reporting queue only. Holds its sessions, so a client must report every
+// Owned by the delegate; reporting queue only. Holds its sessions: a client must report every
 // session that it drops. No operation fails.
 class SessionIndex {
  public:

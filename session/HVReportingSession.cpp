@@ -88,7 +88,7 @@ void HVReportingSession::stop() {
   if (!started()) return;
   kSessionLog.debug("ending session ", number(reporterID()));
   emitTracePoint(ReportingTracePoint::kSessionStopped);
-  // This order is required. The volume messages become part of the history first, so the file and
+  // This order is required. The volume messages become part of the history first: the file and
   // the summary event contain them; the file does not contain the summary event.
   sendVolumeMessages();
   summary_.writeFile();

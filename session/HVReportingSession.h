@@ -32,7 +32,7 @@ inline constexpr std::string_view kHVReportingSessionThrottleSecondsKey = "_thro
 //   any state --last reference released--> destroyed, without being stopped
 //
 // The client's connection object owns it and drives it on the reporting queue. Jobs and analytics
-// payloads that need the session share it, so it is always held by a shared pointer. The properties
+// payloads that need the session share it: it is always held by a shared pointer. The properties
 // may be read and written from any thread; each access is indivisible. No operation fails.
 //
 // Each concern is a member: the profile (what the session is), the history (what it recorded), the

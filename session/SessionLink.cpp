@@ -69,7 +69,7 @@ const std::shared_ptr<platform::DispatchSemaphore>& SessionLink::tlmreportingBac
   return backendSemaphore_;
 }
 
-// A waiting start keeps a copy of the configuration, so it is charged like a message. Without the
+// A waiting start keeps a copy of the configuration and is charged like a message. Without the
 // charge a client that changed, started and stopped one session in a loop, while no server
 // answered, made the service hold 1.2 GB within ten seconds.
 void SessionLink::submitStart(const Owner& owner) {

@@ -56,7 +56,7 @@ Message SessionSummary::createEvent() const {
 
 // Writes the text piece by piece, because a long history and its whole text may not fit into memory
 // together. The directory must therefore exist before the text is made. Every value has a JSON
-// text, so only the file can fail.
+// text: only the file can fail.
 void SessionSummary::writeFile() const {
   if (!HVReportingUtilityIsInternalBuild() || history_.size() == 0) return;
   platform::FileService& files = platform::files();

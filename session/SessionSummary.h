@@ -25,7 +25,7 @@ class SessionSummary {
       : profile_(profile), history_(history) {}
 
   // Passes each volume message to `send` as soon as it is found. The messages of a long history are
-  // many, so they are not collected first; `send` may add to the history.
+  // many and are not collected first; `send` may add to the history.
   void sendVolumeMessages(const Send& send) const;
   // The summary event; none if the history is empty or the session is not started.
   [[nodiscard]] platform::Message createEvent() const;

@@ -20,7 +20,7 @@ namespace halvox {
 //
 // The format, the devices and the process are reported as the client wrote them. Where a number is
 // expected, any other value reads as 0:
-// - A volume that is text counts as volume 0. It still opens and ends intervals, so no time is
+// - A volume that is text counts as volume 0. It still opens and ends intervals: no time is
 //   counted for a volume that was no longer set.
 // - A playing state that is text means "not playing".
 // - The service stamps the times itself. A message whose stamp is missing or not a number opens no

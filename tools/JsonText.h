@@ -25,7 +25,7 @@ std::string toJson(const platform::Value& value);
 std::string quoted(std::string_view text);
 
 // Escapes the characters of a JSON text that could control a terminal or reorder a line. They occur
-// only inside strings, so the meaning stays the same.
+// only inside strings: the meaning stays the same.
 std::string harmlessJson(std::string_view json);
 
 // Makes a text safe to print on one line: control characters become escapes.

@@ -70,7 +70,7 @@ class NewFile {
 };
 
 mode_t modeOfNewFile() {
-  // The mask cannot be read without setting it, so no other thread may create a file meanwhile.
+  // The mask cannot be read without setting it: no other thread may create a file meanwhile.
   const mode_t mask = ::umask(0);
   ::umask(mask);
   return kModeOfNewFiles & ~mask;

@@ -29,7 +29,7 @@ enum class ExistingFiles : std::uint8_t { kRefuse, kReplace };
 // Errors that the archive itself shows are found before anything is unpacked, and no directory is
 // left behind. An error while writing, such as a full disk, leaves the files before it.
 //
-// Changes the working directory of the process while it runs, so no other thread may use relative
+// Changes the working directory of the process while it runs: no other thread may use relative
 // paths.
 [[nodiscard]] platform::linux_::Result<std::vector<std::string>> unpackSnapshot(
     const std::filesystem::path& snapshot, const std::filesystem::path& directory,

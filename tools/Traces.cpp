@@ -45,7 +45,7 @@ constexpr std::uint32_t kLastCode = 0x2104408A;
 constexpr std::chrono::minutes kStopWithin{10};
 // The service ends a tracer that does not answer within ten seconds. Wait longer than that.
 constexpr std::chrono::seconds kRecordsWithin{15};
-// Nothing announces that a recording has begun, so its directory is polled.
+// Nothing announces that a recording has begun: poll its directory.
 constexpr std::chrono::milliseconds kLookEvery{5};
 
 using platform::Dictionary;

@@ -30,7 +30,7 @@ inline constexpr std::string_view TracePointEventsMatchedByProcess = "Process";
 // Reads a property-list file that describes a trace.
 //
 // It never gives up: what is missing or wrong is logged, and reading continues with the rest.
-// Clients name the file, so any content is possible. Belongs to one thread; blocks while it reads
+// Clients name the file: any content is possible. Belongs to one thread; blocks while it reads
 // the disk.
 //
 // Nested values are read as if each had been printed and parsed again, which turns all scalars into

@@ -1,5 +1,5 @@
 /* A bare tracepoint with the fields of halvox:kdebug, as the reference. LTTng includes this header
- * several times with different macros, so it has no ordinary include guard. */
+ * several times with different macros and has no ordinary include guard. */
 #undef LTTNG_UST_TRACEPOINT_PROVIDER
 #define LTTNG_UST_TRACEPOINT_PROVIDER halvox_bare
 

@@ -49,7 +49,7 @@ class Activation(unittest.TestCase):
         services.mkdir()
         text = SERVICE_FILE.read_text()
         self.assertIn("Exec=/usr/bin/halvox-reportingd\n", text)
-        # Its parent is a process of the bus that ends after the start, so the service cannot be
+        # Its parent is a process of the bus that ends after the start: the service cannot be
         # made to end with its parent. If the test is killed, the service ends by itself all the
         # same.
         command = f"{shutil.which('timeout')} 120 {SERVICE}"

@@ -200,7 +200,7 @@ class DriverStatisticsTest(unittest.TestCase):
         self.end_session(3)
         both = self.wait_for_statistics("Simple", 3)[SINK + "Simple_cycles"]
 
-        # The playbacks may take longer than their sound, so only the sum is certain.
+        # The playbacks may take longer than their sound: only the sum is certain.
         self.assertGreater(min(first, second), 0)
         self.assertEqual(both, first + second)
 
