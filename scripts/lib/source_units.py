@@ -17,7 +17,7 @@ import sys
 from dataclasses import dataclass, field
 from pathlib import Path
 
-# Larger units save little: the standard headers are then a small part of the time. With few units
+# Larger units save little: the standard headers are then a small part of the time. With fewer units
 # a processor stays idle at the end.
 UNIT_BYTES = 60_000
 
@@ -28,7 +28,7 @@ TOKEN = re.compile(
 )
 DIRECTIVE = re.compile(r"^[ \t]*#[ \t]*(\w+)(?:\\\n|[^\n])*", re.MULTILINE)
 INCLUDE = re.compile(r'^\s*#\s*include\s*"([^"]+)"', re.MULTILINE)
-# What looks like the declaration of a function.
+# Macros whose uses look like declarations of functions.
 TESTS = {"TEST", "TEST_F", "TEST_P", "TYPED_TEST", "TYPED_TEST_P", "INSTANTIATE_TEST_SUITE_P"}
 DECLARES = {"class", "struct", "union", "enum", "using", "concept", "namespace"}
 NO_NAMES = DECLARES | set(
@@ -57,7 +57,7 @@ def words_and_marks(text):
 
 
 def own_names(tokens):
-    """The names that a source may keep to itself. Rather too many than too few."""
+    """The names that a source may keep to itself. In doubt, a name is included."""
     names = set()
     # For each open brace, whether it is of an anonymous namespace.
     anonymous = []
