@@ -84,6 +84,8 @@ class SqliteStore {
   [[nodiscard]] const ClockService& clock() const { return clock_; }
   // The number of records that wait to be stored. Any thread may call.
   [[nodiscard]] std::uint64_t waiting() { return queue_.waiting(); }
+  // True while many records wait: callers that add one may soon have to wait. Any thread may call.
+  [[nodiscard]] bool isBehind() const { return queue_.isBehind(); }
 
  private:
   using Time = WriterQueue::Time;

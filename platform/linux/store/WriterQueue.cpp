@@ -66,6 +66,8 @@ void WriterQueue::finish(std::uint64_t records, std::uint64_t bytes) {
     const MutexLock lock(mutex_);
     waiting_ -= records;
     estimate(records, bytes);
+    // The estimate may have lowered the limits below what waits already.
+    raiseIfBehind();
     wakeCallers = callersWaiting_ > 0;
     // Well below the soft limit, so that connections do not stop and start again and again.
     relieve = backpressure_.isHigh() && waiting_ <= softRecords_ / 4;
@@ -99,12 +101,16 @@ void WriterQueue::waitForRoom() {
 bool WriterQueue::noteAdded() {
   ++queued_;
   ++waiting_;
-  if (waiting_ >= softRecords_ && !backpressure_.isHigh()) backpressure_.raise();
+  raiseIfBehind();
   const bool wake =
       writer_ == Writer::kIdle || (writer_ == Writer::kGathering && queued_ >= gatherRecords_);
   // One wake-up is enough, however many records are added before the writer runs.
   if (wake) writer_ = Writer::kWorking;
   return wake;
+}
+
+void WriterQueue::raiseIfBehind() {
+  if (waiting_ >= softRecords_ && !backpressure_.isHigh()) backpressure_.raise();
 }
 
 void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {

@@ -86,6 +86,9 @@ class WriterQueue {
 
   // Any thread. The number of records that were added and are not finished.
   [[nodiscard]] std::uint64_t waiting() HALVOX_EXCLUDES(mutex_);
+  // Any thread. True from the soft limit on, until the backpressure is relieved. While it is false,
+  // add() finds room unless other threads fill the queue at that moment. Takes no lock.
+  [[nodiscard]] bool isBehind() const { return backpressure_.isHigh(); }
   [[nodiscard]] const QueueLimits& limits() const { return limits_; }
 
  private:
@@ -93,6 +96,7 @@ class WriterQueue {
 
   void waitForRoom() HALVOX_REQUIRES(mutex_);
   bool noteAdded() HALVOX_REQUIRES(mutex_);
+  void raiseIfBehind() HALVOX_REQUIRES(mutex_);
   void estimate(std::uint64_t records, std::uint64_t bytes) HALVOX_REQUIRES(mutex_);
 
   const QueueLimits limits_;

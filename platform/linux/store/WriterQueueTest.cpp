@@ -47,6 +47,20 @@ TEST(WriterQueueTest, RelievesBackpressureBelowAQuarterAndCallsTheHandler) {
   EXPECT_EQ(reliefs, 1);
 }
 
+TEST(WriterQueueTest, RaisesBackpressureWhenTheLimitFallsBelowWhatWaits) {
+  Backpressure backpressure;
+  WriterQueue queue(kSmall, backpressure);
+  addMany(queue, 2);
+  ASSERT_TRUE(queue.take(soon(), [] {}));
+  addMany(queue, 4);
+  ASSERT_FALSE(queue.isBehind());
+
+  // Such payloads allow two records to wait, and callers wait from the fourth one on.
+  queue.finish(2, 1000);
+
+  EXPECT_TRUE(queue.isBehind());
+}
+
 TEST(WriterQueueTest, MakesCallersWaitAtTheHardLimitUntilThereIsRoom) {
   Backpressure backpressure;
   WriterQueue queue(kSmall, backpressure);

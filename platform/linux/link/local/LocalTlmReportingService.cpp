@@ -11,6 +11,7 @@ constexpr std::int64_t kStoreClosed = 1;
 LocalTlmReportingService::LocalTlmReportingService(SqliteStore& store, const ClockService& clock,
                                                    CallbackThread& callbacks)
     : ServerlessTlmReportingService(kBackendName, Array{kBackendName}, callbacks),
+      store_(store),
       records_(store.linkMessages()),
       clock_(clock) {}
 

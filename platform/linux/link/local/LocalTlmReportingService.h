@@ -21,11 +21,16 @@ class LocalTlmReportingService final : public ServerlessTlmReportingService {
   LocalTlmReportingService(SqliteStore& store, const ClockService& clock,
                            CallbackThread& callbacks);
 
+  // Not while the store is behind: a send may then wait for room, which must not hold up the thread
+  // that carries out the requests of all clients.
+  [[nodiscard]] bool onlyNotesMessages() const override { return !store_.isBehind(); }
+
  private:
   // Refuses a message only after the store was closed.
   TLMReportingOutcome accept(const std::shared_ptr<const LinkParty>& sender,
                              const TLMReportingMessage& message) override;
 
+  const SqliteStore& store_;
   LinkMessageRecords& records_;
   const ClockService& clock_;
 };

@@ -60,6 +60,17 @@ TEST_F(LocalTlmReportingServiceTest, MessageIsStoredUnderItsSession) {
                                        "{\"volume\":0.5}"));
 }
 
+TEST_F(LocalTlmReportingServiceTest, OnlyNotesMessagesUnlessTheStoreIsBehind) {
+  startLink();
+  EXPECT_TRUE(link->onlyNotesMessages());
+
+  backpressure.raise();
+  EXPECT_FALSE(link->onlyNotesMessages());
+
+  backpressure.relieve();
+  EXPECT_TRUE(link->onlyNotesMessages());
+}
+
 TEST_F(LocalTlmReportingServiceTest, MessageOutlivesItsSession) {
   startLink();
   auto session = link->TLMReportingCreateSession(sessionInfo(7), userInfo("s"));

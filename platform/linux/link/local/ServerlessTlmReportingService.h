@@ -26,7 +26,7 @@ class ServerlessTlmReportingService : public TLMReportingService {
   void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) final;
   TLMReportingOutcome TLMReportingSendMessage(const Session& session,
                                               const TLMReportingMessage& message) final;
-  [[nodiscard]] bool onlyNotesMessages() const final { return true; }
+  [[nodiscard]] bool onlyNotesMessages() const override { return true; }
   void TLMReportingFlushMessages(const Session& session, std::function<void()> flushed) final;
   TLMReportingOutcome TLMReportingSendOneMessage(const Dictionary& sessionInfo,
                                                  const Dictionary& userInfo,
