@@ -184,7 +184,7 @@ void addRequestCommands(CommandSet& commands) {
                            .example = "halvoxctl list --json"});
   addBare<Kill>(commands,
                 {.name = "kill",
-                 .summary = "End the service at once, without cleanup; only root and its user may",
+                 .summary = "End the service at once, without cleanup; only for root and its user",
                  .example = "halvoxctl kill"});
 }
 

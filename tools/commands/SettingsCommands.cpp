@@ -25,7 +25,7 @@ Preferences checked(const Preferences& request) {
   if ((request.action == Action::kSet) != request.value.has_value()) {
     throw CLI::ValidationError("VALUE", request.value.has_value()
                                             ? "is only for set"
-                                            : "is missing; expected what to set the key to");
+                                            : "is missing; expected the new value of the key");
   }
   return request;
 }

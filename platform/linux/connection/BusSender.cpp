@@ -38,7 +38,7 @@ void BusSender::receive(const dbus::MessageHeader& header, std::span<const std::
   }
   host().statistics().requestsReceived.add();
   refuse(header, Refusal::kTooManyWaiting, error_names::kLimitsExceeded,
-         std::to_string(waiting) + " bytes of earlier requests are waiting, the limit is " +
+         std::to_string(waiting) + " bytes of earlier requests are waiting; the limit is " +
              std::to_string(kMaxWaitingBytesOfSender) + "; wait for replies before sending more");
 }
 
@@ -59,7 +59,7 @@ void BusSender::onCredentials(const PeerCredentials& credentials) {
 }
 
 void BusSender::onVanished() {
-  // Its requests are still delivered: it may have sent a message and left on purpose.
+  // Deliver the remaining requests: the sender may have sent a message and left on purpose.
   vanished_ = true;
   deliverReceived();
 }

@@ -44,7 +44,7 @@ StandardAnswer hello(const StandardRequest& request) {
   // D-Bus allows one Hello for each connection. Libraries send it without asking whether there is a
   // bus.
   if (request.client.takeHello()) return {.value = Value(uniqueNameOf(request.client))};
-  return {.errorName = error_names::kFailed, .errorText = "the connection has its name already"};
+  return {.errorName = error_names::kFailed, .errorText = "the connection already has its name"};
 }
 
 // The service sends no signals to clients. A match can therefore be accepted without storing it.

@@ -121,7 +121,7 @@ void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
   if (request.type != dbus::MessageType::kMethodCall) return;
   host_.statistics().requestsReceived.add();
   refuse(request, Refusal::kTooLarge, error_names::kLimitsExceeded,
-         "the message has " + std::to_string(next.totalBytes) + " bytes, the limit is " +
+         "the message has " + std::to_string(next.totalBytes) + " bytes; the limit is " +
              std::to_string(host_.options().maxFrameBytes));
 }
 

@@ -155,7 +155,7 @@ bool RequestDispatcher::isForbidden(const Request& request, const InterfaceMetho
   const std::string who = user == kUnknownUser ? "an unknown user" : "uid " + std::to_string(user);
   request.client.refuse(request.header(), Refusal::kNotAllowed, error_names::kAccessDenied,
                         quoted(method.name) + ": only root and the service's own user (uid " +
-                            std::to_string(owner) + ") may call this, the client is " + who);
+                            std::to_string(owner) + ") may call this; the client is " + who);
   return true;
 }
 

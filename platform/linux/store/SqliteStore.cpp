@@ -186,7 +186,7 @@ Result<std::string, StoreError> SqliteStore::beginAnew(const std::string& findin
 }
 
 // Begins a new database. Copies the records of this run, which are newer than `extent_`, into it.
-// Those of earlier runs are only in the renamed file.
+// Records of earlier runs remain only in the renamed file.
 void SqliteStore::replaceDamaged(const std::string& finding) {
   // Copy the extent, because useDatabase() below replaces it with that of the new database.
   const StoreExtent extent = extent_;
@@ -266,7 +266,7 @@ void SqliteStore::drop(DropReason reason, std::string_view what) {
   nextRound_ = std::chrono::steady_clock::now() + kRetryTime;
   if (!failureLines_.tryPass()) return;
   kLog.error("", what, "; ", droppedSinceStored_,
-             " records dropped since records were last stored; trying again with the next");
+             " records dropped since records were last stored; trying again with the next records");
 }
 
 void SqliteStore::maintainWhileIdle() {

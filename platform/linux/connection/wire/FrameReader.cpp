@@ -264,12 +264,12 @@ FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrame
   // exceeded.
   if (total > kMaxMessageBytes) {
     return broken("the header claims a message of " + std::to_string(total) +
-                      " bytes, the limit of D-Bus is " + std::to_string(kMaxMessageBytes),
+                      " bytes; the limit of D-Bus is " + std::to_string(kMaxMessageBytes),
                   kBodyLengthOffset);
   }
   if (total > maxFrameBytes) {
     return broken("the header claims a message of " + std::to_string(total) +
-                      " bytes, the limit is " + std::to_string(maxFrameBytes),
+                      " bytes; the limit is " + std::to_string(maxFrameBytes),
                   kBodyLengthOffset);
   }
   return {FrameMeasure::State::kKnown, static_cast<std::size_t>(total), {}};

@@ -246,12 +246,12 @@ void NatsLink::onAway(natsConnection* connection) {
     const MutexLock lock(mutex_);
     if (connection != connection_.get()) return;
     if (state_ == State::kConnected) state_ = State::kAway;
-    // Hold before the library reconnects: a message that is published then would overtake those
-    // that were on their way.
+    // Hold before the library reconnects. Otherwise, a message that is published after that would
+    // overtake the messages that were on their way.
     publisher_.holdAfterLoss();
     changed_.notifyAll();
   }
-  kLog.notice("lost the connection to NATS; reconnecting, messages wait");
+  kLog.notice("lost the connection to NATS; reconnecting; messages wait");
 }
 
 void NatsLink::onClosed(natsConnection* connection) {
