@@ -6,10 +6,10 @@
 
 namespace halvox::client {
 
-// The thread of a client, with a stack of 512 KiB. The default stack of 8 MiB would be in memory as
-// a whole in a program that has called mlockall(MCL_FUTURE), and such programs are what the client
-// is for. If the C library needs more, because the program has many thread-local variables, the
-// thread has the default size.
+// The thread of a client, with a stack of 512 KiB. The client is made for programs that call
+// mlockall(MCL_FUTURE). In such a program all 8 MiB of a default stack would be resident. If the C
+// library needs more than 512 KiB, because the program has many thread-local variables, the thread
+// gets a stack of the default size.
 //
 //   empty ──start()──► running ──destruction──► joined
 //                         └──────abandon()────► empty

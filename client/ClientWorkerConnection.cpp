@@ -16,8 +16,8 @@ constexpr std::size_t kMaxOpenBytes = std::size_t{4} << 20U;
 // A full window opens again when half of it is answered: fewer and larger writes.
 constexpr std::size_t kReopenAtCalls = kMaxOpenCalls / 2;
 constexpr std::size_t kReopenAtBytes = kMaxOpenBytes / 2;
-// The most calls to track after one that has no answer. A service that leaves a call unanswered for
-// so long is taken to be broken.
+// Calls are tracked from the oldest unanswered one to the newest. If there are more than this, the
+// service is considered broken, and the client closes the connection.
 constexpr std::size_t kMostTrackedCalls = std::size_t{1} << 16U;
 // How many messages are sent before their room is given back to the producers.
 constexpr int kReleaseAfter = 64;

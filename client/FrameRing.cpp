@@ -17,7 +17,7 @@ constexpr std::size_t kMostFrames = std::size_t{1} << 24U;
 // page fault would cost an audio thread more than the whole message. A multiple of any page.
 constexpr std::size_t kTouchedBytes = std::size_t{256} * 1024;
 
-// The high half of a word counts, the low half is the number of a cell + 1, or 0 for none.
+// The high half of a word is a counter. The low half is the number of a cell plus 1, or 0 for none.
 constexpr std::uint64_t kOneMore = std::uint64_t{1} << 32U;
 constexpr std::uint64_t kCountMask = ~std::uint64_t{UINT32_MAX};
 std::uint32_t countOf(std::uint64_t word) { return static_cast<std::uint32_t>(word >> 32U); }
@@ -105,7 +105,8 @@ void FrameRing::setHead(CellNumber number, const FrameHead& head) const {
 }
 
 bool FrameRing::isFull(std::uint64_t newest) const {
-  // An outdated count may be below the released ones; the difference is then negative.
+  // `newest` may be outdated, with a count below that of the released frames. The difference is
+  // then negative.
   const auto released = static_cast<std::uint32_t>(released_.load(std::memory_order_relaxed));
   return static_cast<std::int32_t>(countOf(newest) - released) >=
          static_cast<std::int32_t>(maxFrames_);

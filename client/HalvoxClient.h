@@ -94,8 +94,9 @@ struct Counters {
 //
 // One thread of its own exchanges all messages with the service. The operations below hand work to
 // that thread, in order, and requests are pipelined. If the service ends, the client waits for a
-// new one, connects to it and makes its sessions again: created, typed, configured and, if they
-// were running, started. Messages that are handed over meanwhile wait, up to the bounds.
+// new one and connects to it. It then creates its sessions again with their types and
+// configurations, and starts those that were running. Messages from the meantime wait, up to the
+// bounds.
 //
 // Any thread may call these functions. send() encodes the message on the caller's thread, and keeps
 // no reference to it. An audio thread may call it: it never blocks, takes no lock, allocates

@@ -39,7 +39,8 @@ enum class EncodeOutcome : std::uint8_t {
 EncodeOutcome encodeBody(SegmentWriter& writer, const MessageView& message);
 EncodeOutcome encodeBody(SegmentWriter& writer, const EncodedMessageView& message);
 
-// The header of sendMessage: its size, a multiple of 8, and its bytes before a body of that size.
+// The header of sendMessage. Its size is constant and a multiple of 8. putMessageHeader() writes
+// the header for a body of `bodyBytes`.
 extern const std::size_t kMessageHeaderBytes;
 void putMessageHeader(char* frame, std::size_t bodyBytes);
 

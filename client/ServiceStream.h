@@ -35,7 +35,7 @@ class ServiceStream {
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(fd_) && !ended_; }
   // Returns true once the service has agreed to the handshake.
   [[nodiscard]] bool isReady() const { return ready_; }
-  // What to wait for on the socket: `events`, and that it can be written to while there is output.
+  // Returns the argument for poll(2): waits for `events`, and for POLLOUT while output is unsent.
   [[nodiscard]] pollfd polled(short events) const {
     return {fd_.get(), static_cast<short>(hasOutput() ? events | POLLOUT : events), 0};
   }

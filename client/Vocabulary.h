@@ -101,8 +101,8 @@ std::span<const NamedNumber> eventTypes();
 std::span<const NamedNumber> serviceTypes();
 
 // Return the name of a number in the service's spelling: "Session_Playback", "Start", "telephony".
-// A category without a name is "Undefined", after its domain if it has one. An event type without a
-// name is "Generic", a service type "telephony".
+// Numbers without a name: a category is "Undefined", with its domain as a prefix if it has one; an
+// event type is "Generic"; a service type is "telephony".
 std::string categoryName(Category category);
 std::string_view eventTypeName(EventType type);
 std::string_view serviceTypeName(ServiceType type);

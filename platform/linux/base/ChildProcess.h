@@ -79,7 +79,7 @@ class ChildProcess {
 
   // signal() sends a signal to the child. signalGroup() sends it to all processes of the child's
   // group if the child has a group of its own, and otherwise only to the child. Both do nothing
-  // after the end.
+  // after a function of this class has returned how the child ended.
   void signal(int number) const;
   void signalGroup(int number) const;
 
@@ -91,7 +91,7 @@ class ChildProcess {
   // Waits until the child ends.
   ChildEnd wait();
   // Sends SIGKILL to the child, and to its group if it has one of its own, and waits until the
-  // child has ended. Returns how it ended. If it had ended before, only returns that.
+  // child has ended. Sends no signal after the end. Returns how the child ended.
   ChildEnd kill();
 
   // Gives up the child, which keeps running. Returns its process ID; the caller may wait for it.

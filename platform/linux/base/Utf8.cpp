@@ -151,7 +151,7 @@ std::size_t appendEscaped(std::string& line, std::string_view text, std::size_t 
   while (taken < text.size()) {
     const std::string_view rest = text.substr(taken);
     const auto end = std::ranges::find_if_not(rest, isPlain);
-    // Append plain characters as one run: nearly all texts have no others.
+    // Append plain characters as one run: nearly all texts consist of plain characters only.
     if (const auto plain = static_cast<std::size_t>(end - rest.begin()); plain > 0) {
       const std::size_t fitting = std::min(plain, room);
       line += rest.substr(0, fitting);

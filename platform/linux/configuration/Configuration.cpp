@@ -21,7 +21,7 @@ namespace {
 
 // A wrong path, such as that of a device, must not fill the memory at the start.
 constexpr std::size_t kLargestFile = 1U << 20U;
-// Less than PATH_MAX, with room for the names of files below the path.
+// Less than PATH_MAX, to leave room for the names of files below the path.
 constexpr std::size_t kLongestPath = 4000;
 constexpr std::size_t kLongestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
 constexpr std::size_t kLongestStreamName = 255;  // the server uses it as the name of a directory
@@ -173,8 +173,8 @@ void readLinkTls(TableReader table, std::optional<Configuration::Link::Tls>& res
   table.read("certificate", tls.certificate, kLongestPath);
   table.read("key", tls.key, kLongestPath);
   table.read("verify", tls.verify);
-  // The link needs both. It would ignore a key without a certificate, and the servers would then
-  // refuse the link.
+  // Require the certificate and the key together: the link would ignore a key without a
+  // certificate, and the servers would then refuse the link.
   if (tls.key.empty()) table.refuse("certificate", "a path together with link.tls.key");
   if (tls.certificate.empty()) table.refuse("key", "a path together with link.tls.certificate");
   table.finish();

@@ -32,7 +32,7 @@ inline constexpr const char* kWantedEvents = "*";  // a pattern for fnmatch(3): 
 // MiB of history and waiting messages. Far more than an audio server needs; a client that leaks
 // sessions reaches it before the machine runs out of memory.
 inline constexpr std::uint64_t kClientHistoryMegabytes = 256;
-// Sessions. An audio server has one for each stream, and tens of streams.
+// Sessions. An audio server has one session for each stream, and typically tens of streams.
 inline constexpr std::uint64_t kClientSessions = 100'000;
 // Reporter IDs of one message. A message to 10,000 sessions takes some hundredths of a second,
 // during which no other request is carried out.

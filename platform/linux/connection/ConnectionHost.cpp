@@ -119,8 +119,8 @@ Result<void, ConnectionOpenError> ConnectionHost::openBuses() {
     if (!joined) return joined;
   }
   if (!starter.has_value() || isStartersBus) return {};
-  // Start even if this bus cannot be joined. A terminal that a bus has started passes these
-  // variables to every program in it, where they may be wrong.
+  // Start even if this bus cannot be joined. The address comes from environment variables. A
+  // terminal that a bus has started passes them on to every program, for which they may be wrong.
   if (const auto joined = joinBus(starter->address); !joined) {
     kLog.error("cannot join the bus that started the service: ", joined.error().message,
                "; clients reach it through its socket", wantsBus ? " and listener.bus" : "");

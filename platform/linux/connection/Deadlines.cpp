@@ -26,7 +26,7 @@ std::optional<DeadlineQueue::Clock::time_point> DeadlineQueue::first() const {
 void DeadlineQueue::expire(Clock::time_point now) {
   while (first_ != nullptr && first_->at_ <= now) {
     Deadline& due = *first_;
-    // Stop it first, because its owner may start it again or destroy it.
+    // Remove the deadline first, because its owner may start it again or destroy it.
     remove(due);
     due.owner_.onDeadline();
   }

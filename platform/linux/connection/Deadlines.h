@@ -18,8 +18,8 @@ class DeadlineOwner {
   virtual void onDeadline() = 0;
 };
 
-// One deadline of an owner. It is in at most one queue, and leaves it when it is destroyed. Belongs
-// to the thread of the queue.
+// One deadline of an owner. Is in at most one queue. The destructor removes the deadline from its
+// queue. Belongs to the thread of the queue.
 class Deadline {
  public:
   explicit Deadline(DeadlineOwner& owner) : owner_(owner) {}

@@ -131,8 +131,8 @@ std::vector<std::byte> FrameBuffer::withoutBody(const Next& oversized) {
   return frame;
 }
 
-// Above 0 if the next read must not go to the scratch. It is then the number of missing bytes of a
-// large frame, or the size of one read if the scratch has no room for what is left over.
+// Returns 0 if the next read may go to the scratch. Otherwise returns the most bytes to read into
+// own_: the missing bytes of a large frame, or one read if the unused bytes do not fit the scratch.
 std::size_t FrameBuffer::bytesThatDoNotFitScratch() const {
   if (view_.size() >= dbus::kFrameStartBytes) {
     const dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);

@@ -53,7 +53,8 @@ void appendStandardInterfaces(std::string& xml, bool isObject) {
   if (!open.empty()) xml += " </interface>\n";
 }
 
-// The name of a parent's only child: the next element of the object's path.
+// Returns the name of the only child of `path`, a parent of the object: the next element of
+// `objectPath`.
 std::string_view childOf(std::string_view path, std::string_view objectPath) {
   const std::size_t start = path == "/" ? 1 : path.size() + 1;
   return objectPath.substr(start, objectPath.find('/', start) - start);

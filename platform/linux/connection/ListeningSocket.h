@@ -27,7 +27,8 @@ class ListeningSocket final : public EventSource, private DeadlineOwner {
 
   // Returns false if the socket cannot be watched.
   [[nodiscard]] bool start();
-  // One of our connections has closed its descriptor.
+  // Accepts again if accepting has stopped for lack of descriptors. Called when a connection of the
+  // service has closed its descriptor.
   void tryAgain();
   void onReady(std::uint32_t events) override;
 

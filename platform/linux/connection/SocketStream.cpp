@@ -63,7 +63,7 @@ void SocketStream::flush() {
   if (dropped > 0) host_.statistics().repliesDroppedGone.add(dropped);
   const bool wasBlocked = std::exchange(blocked_, result == OutputQueue::Flush::kBlocked);
   if (wasBlocked != blocked_) updateInterest();
-  // Called after a failure, too: output that was dropped makes room.
+  // Notify the owner after a failure too: dropping output also makes room.
   owner_.onOutputProgress();
 }
 

@@ -50,7 +50,7 @@ class AsioDispatchService final : public DispatchService {
   // Both services must outlive this one and its queues. Throws std::system_error if the system has
   // no threads or descriptors left.
   AsioDispatchService(LogService& log, StatisticsService& statistics);
-  // Stops, and waits for the running jobs without a limit.
+  // Stops, and waits without a time limit for the running jobs to end.
   ~AsioDispatchService() override;
 
   std::shared_ptr<DispatchQueue> createSerialQueue(std::string_view label, QualityOfService quality,

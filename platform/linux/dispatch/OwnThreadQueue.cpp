@@ -175,8 +175,8 @@ std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit
       isFront = next_ == batch_.size();
     }
     hasWorker_ = false;
-    // After close() or stop(), wake it even without work: the own thread has waited for this
-    // helper.
+    // After close() or stop(), wake the own thread even without work: it may be waiting for this
+    // helper to finish.
     mustWake = (hasWork() || life_ != Life::kOpen) && takeWakeUp();
   }
   if (mustWake) wakeUp_.notifyOne();

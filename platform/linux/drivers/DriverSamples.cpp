@@ -156,8 +156,8 @@ std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
     for (const std::uint32_t position : *selection) {
       const ChannelList::Channel& channel = (*now->channels)[position];
       const auto found = before.find(channel.get());
-      // A channel that appeared after the first sample may have counted long before. Do not report
-      // it.
+      // Skip a channel that appeared after the first sample: its values may include counts from
+      // before that sample.
       if (found == before.end()) continue;
       appendDifference(*channel, found->second, valuesOf(*now, position), reading->values);
       channels.push_back(channel);

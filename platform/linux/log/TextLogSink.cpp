@@ -76,7 +76,7 @@ bool TextLogSink::waitForReader() {
       const auto left =
           std::chrono::duration_cast<std::chrono::milliseconds>(*deadline_ - Clock::now());
       timeout = static_cast<int>(std::max<std::int64_t>(left.count(), 0));
-      // Do not poll it again: an event that stays readable would end each wait at once.
+      // Do not poll `finish_` any more: it stays readable and would end each wait at once.
       polled[1].fd = -1;
     }
     const int ready = ::poll(polled.data(), polled.size(), timeout);

@@ -86,8 +86,8 @@ std::error_code DirectoryWatch::watchWay(std::size_t directory) {
       error = add(path, isTarget ? kChanging | kLeaving : kLeaving, watch);
       if (isMissing(error)) return {};
     }
-    // A directory that may be searched but not read cannot be watched. If it is only on the way,
-    // assume that it stays where it is.
+    // A directory that may be searched but not read cannot be watched. If it is only a parent of
+    // the target, assume that it is never moved or deleted.
     if (error == std::errc::permission_denied && !isTarget) error.clear();
     if (error) return error;
     if (isTarget) {

@@ -38,9 +38,8 @@ struct SettingBaseline {
 // Decides which notifications to post after files have changed.
 //
 // A name is posted when the file of that name in the notify directory changes, and when the values
-// of one of its domains change. A name belongs to the domain of the same name, and to every domain
-// that it begins with, followed by a dot. No list of names and domains is needed, and a new domain
-// works at once.
+// of one of its domains change. The name "a.b.c" belongs to the domains "a.b.c", "a.b" and "a". No
+// list of names and domains is needed, and a new domain works at once.
 //
 // Remembers the last state of each file and compares with it, so that it also finds changes that
 // were not announced. A preference file that cannot be read counts as unchanged until it can be

@@ -9,8 +9,8 @@ namespace {
 
 constexpr UnitLog kLog{storeCategory, "MessageRecords"};
 
-// Memory for this many records is kept between rounds: as many as the queue's soft limit. A burst
-// that needed more gives its memory back.
+// Memory for this many records is kept between rounds: as many as the queue's soft limit. Memory
+// that a burst needed beyond that is freed.
 constexpr std::size_t kKeptRecords = 8192;
 
 }  // namespace

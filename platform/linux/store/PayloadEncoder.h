@@ -35,8 +35,8 @@ class PayloadEncoder {
   std::unique_ptr<Text> text_;
 };
 
-// Returns true only if both dictionaries encode to the same text, without encoding them. May
-// return false for equal texts; the store then writes the payload twice. Comparing the values with
+// Compares two dictionaries without encoding them. Returns true only if both encode to the same
+// text. May return false for equal texts; the store then writes the payload twice. Comparing with
 // == would be wrong: 1 and true are equal values with different texts.
 [[nodiscard]] bool encodeAlike(const Dictionary& left, const Dictionary& right);
 

@@ -70,8 +70,8 @@ class SimpleRecords final : public SimpleRecordKind {
   }
 
  private:
-  // Memory for this many records is kept between rounds: as many as the queue's soft limit. A burst
-  // that needed more gives its memory back.
+  // Memory for this many records is kept between rounds: as many as the queue's soft limit. Memory
+  // that a burst needed beyond that is freed.
   static constexpr std::size_t kKeptRecords = 8192;
 
   std::size_t takeRecords() override {

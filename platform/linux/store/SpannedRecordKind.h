@@ -68,7 +68,7 @@ class SpannedRecordKind : public RecordKind {
   [[nodiscard]] PayloadEncoder& encoder() { return encoder_; }
 
  private:
-  // Writes the next taken record, or the next two if they share one.
+  // Writes the next taken record.
   [[nodiscard]] virtual SqliteCode writeNext(TransactionAllowance& allowance) = 0;
   // Frees all taken records, after a failed transaction. Returns how many were not written.
   virtual std::uint64_t forgetTaken() = 0;

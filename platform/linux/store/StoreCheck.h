@@ -61,7 +61,7 @@ class StoreCheck {
   [[nodiscard]] bool pause(std::chrono::steady_clock::duration length) HALVOX_EXCLUDES(mutex_);
 
   std::thread thread_;
-  // Used by the thread, and by others when it has ended.
+  // Used by the thread, and by other threads after it has ended.
   std::uint64_t records_ = 0;  // read so far
   bool isChecked_ = true;      // nothing is left to check
   Mutex mutex_;

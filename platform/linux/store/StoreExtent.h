@@ -20,7 +20,7 @@ struct KindTables {
   std::string_view count = "count(*)";  // the number of records, over all rows
 };
 
-// Those of analytics and link messages belong to the versions before blocks.
+// Only versions without message_blocks wrote to analytics_records and link_message_records.
 inline constexpr std::array<KindTables, 6> kKindTables{{
     {"analytics_records", "analytics_spans"},
     {"issue_metric_records", "issue_metric_spans"},
@@ -43,7 +43,7 @@ struct StoreExtent {
 // Copies the records that are newer than `extent` from the database in `file` into `database`,
 // which must be open for writing, have all tables and hold no records. Skips a kind that cannot be
 // read. Returns the number of copied records. `problem` names what could not be copied, and is
-// empty if everything was. Blocks on the disk.
+// empty if everything was copied. Blocks on the disk.
 [[nodiscard]] std::uint64_t copyRecordsAfter(const StoreExtent& extent, const std::string& file,
                                              Database& database, std::string& problem);
 

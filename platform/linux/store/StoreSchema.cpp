@@ -100,17 +100,18 @@ CREATE VIEW snapshots(time, signature, path) AS
 SELECT time, signature, path FROM snapshot_records;
 )sql";
 
-// Events and link messages of earlier versions stay where they are until they are too old: moving
-// them would take minutes. New ones go into blocks, and the views show both. The tables
+// Events and link messages of earlier versions stay in their tables until retention deletes them:
+// moving them would take minutes. New ones go into blocks, and the views show both. The tables
 // halvox_events and halvox_links unpack blocks. The programs of this system have these tables;
 // others load halvox-sqlite.so.
 //
 // message_blocks.id is the number of the block's first record. Numbers continue after those of the
-// old tables, in which the events of record n have the numbers 2n and 2n + 1 and a link message has
-// that of its record. The row without records keeps the first number.
+// old tables. There, the events of record n have the numbers 2n and 2n + 1, and a link message has
+// the number of its record. The INSERT adds a block without records, which stores the first free
+// number.
 //
-// A row of message_spans exists for each sealed block and has its number. Its keys say which
-// sessions, applications and names the block has (blocks/BlockKeys.h).
+// message_spans has one row for each sealed block, with the same number as the block. Its keys say
+// which sessions, applications and names occur in the block (blocks/BlockKeys.h).
 constexpr std::string_view kMessageBlocks = R"sql(
 CREATE TABLE message_blocks(
   id INTEGER PRIMARY KEY,

@@ -117,8 +117,9 @@ void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {
   if (records == 0) return;
   const Time now = clock_();
   const std::chrono::nanoseconds elapsed = now - std::exchange(workingSince_, now);
-  // The estimates rise at once and fall by at most a quarter a batch. Too high a limit breaks the
-  // promised half second; too low a limit only slows callers for a moment.
+  // The estimates rise at once, and fall by at most a quarter with each batch. After an estimate
+  // that is too low, the limit is too high and breaks the promised half second. After one that is
+  // too high, the limit is too low and only slows callers for a moment.
   bytesPerRecord_ = std::max(bytes / records, bytesPerRecord_ - bytesPerRecord_ / 4);
   // A small batch also counts if it took as long as a full queue may take.
   if (records >= kTellingRecords || elapsed >= limits_.softTime) {

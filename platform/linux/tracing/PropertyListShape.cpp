@@ -214,7 +214,7 @@ class BinaryShape {
     return isTooLarge ? kTooLarge : nullptr;
   }
 
-  // Fills in the content of an object. Whether the object itself is valid is left to the library.
+  // Fills in the content of an object. The library checks whether the object itself is valid.
   Reason read(std::uint64_t object, Object& content) const {
     enum : std::uint8_t { kData = 4, kAscii = 5, kUtf16 = 6, kArray = 10, kDictionary = 13 };
     std::size_t at = number(offsets_ + object * offsetSize_, offsetSize_);

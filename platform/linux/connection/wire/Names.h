@@ -10,8 +10,8 @@ inline constexpr std::size_t kMaxNameBytes = 255;
 
 // "/", or "/element/element". Elements consist of letters, digits and underscores.
 [[nodiscard]] bool isObjectPath(std::string_view text);
-// Two or more such elements with dots between, none of which starts with a digit. Also the rule for
-// names of errors.
+// Two or more such elements, separated by dots. No element starts with a digit. Names of errors
+// follow the same rule.
 [[nodiscard]] bool isInterfaceName(std::string_view text);
 // One such element.
 [[nodiscard]] bool isMemberName(std::string_view text);

@@ -21,7 +21,7 @@ class TailCache {
   // Longer arguments are decoded.
   static constexpr std::size_t kMostBytes = 64;
 
-  // What the values of arguments depend on.
+  // The encoded arguments. Two equal sources decode to equal values.
   struct Source {
     std::string_view types;
     std::string_view bytes;  // up to the end of the message

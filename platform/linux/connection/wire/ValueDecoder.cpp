@@ -72,8 +72,8 @@ class Decoder {
   // False if the dictionary that is being decoded may have a key twice. Only for dictionaries with
   // known keys, which are arguments: they are never inside each other.
   bool hasDistinctKeys_ = false;
-  // Describes the error. `path_` is its place: each container adds its step while decoding leaves
-  // it.
+  // Describe the error. `path_` is where it occurred: after a failure, each enclosing container
+  // adds its own step as its decoding function returns.
   bool failed_ = false;
   Kind kind_ = Kind::kMalformed;
   std::string_view problem_;
@@ -84,7 +84,7 @@ class Decoder {
 bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& arguments) {
   std::optional<TailCache::Source> tail;
   for (std::string_view rest = types; !rest.empty();) {
-    // Only after a dictionary: other requests are too small to gain from it.
+    // Use the cache only after a dictionary: other requests are too small to gain from it.
     if (scratch_.caches != nullptr && arguments.size() == 1 && arguments.front().isDictionary()) {
       tail = {rest, reader_.rest(), reader_.position(), !reader_.isHostOrder()};
       if (takeKnownTail(*tail, arguments)) return true;

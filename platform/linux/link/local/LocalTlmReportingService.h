@@ -21,8 +21,8 @@ class LocalTlmReportingService final : public ServerlessTlmReportingService {
   LocalTlmReportingService(SqliteStore& store, const ClockService& clock,
                            CallbackThread& callbacks);
 
-  // Not while the store is behind: a send may then wait for room, which must not hold up the thread
-  // that carries out the requests of all clients.
+  // False while the store is behind: a send may then wait for room, and the thread that carries out
+  // the requests of all clients must not wait.
   [[nodiscard]] bool onlyNotesMessages() const override { return !store_.isBehind(); }
 
  private:

@@ -151,8 +151,8 @@ bool NatsLink::close() {
   return true;
 }
 
-// False if the thread still runs at leaveBy_. The thread itself moves that time: to a later one
-// before work that ends within known limits, and to an earlier one before work that may hang.
+// Returns false if the thread still runs at leaveBy_. The thread itself sets leaveBy_: to a later
+// time before work that ends within known limits, to an earlier one before work that may hang.
 bool NatsLink::awaitThread() {
   {
     const MutexLock lock(mutex_);

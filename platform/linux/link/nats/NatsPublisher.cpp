@@ -149,7 +149,7 @@ NatsPublisher::Step NatsPublisher::nextStep(Time now) {
   // Wait until half of the window is free: waking the thread for every acknowledgement costs more
   // than the acknowledgement itself.
   if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
-  // No message remains whose order a probe could keep.
+  // A probe keeps unacknowledged messages in order. Without such messages it has no purpose.
   if (pending_.size() == 0) flow_ = Flow::kFlowing;
   if (flow_ == Flow::kProbing) return Step::kWait;
   if (flow_ == Flow::kHolding) return now >= probeAt_ ? Step::kProbe : Step::kWait;

@@ -55,9 +55,9 @@ class PendingAcks {
 
   // Call only while needsAgain() is false.
   void add(const natsMsg* message, Entry entry);
-  // Removes a message that the library has reported about; returns none if it was overdue before.
+  // Removes a message that the library has reported about; returns none if it was already overdue.
   std::optional<Entry> take(const natsMsg* message);
-  // Holds a message that the library gave back. Returns false if it was overdue before.
+  // Holds a message that the library gave back. Returns false if it was already overdue.
   bool giveBack(NatsMessage message);
 
   void beginAgain() { again_ = first_; }

@@ -77,7 +77,8 @@ class Sink {
     bt_message_array_const messages = nullptr;
     std::uint64_t count = 0;
     const auto status = bt_message_iterator_next(iterator, &messages, &count);
-    // babeltrace gives the statuses of both functions the same numbers.
+    // The cast is valid: babeltrace defines the statuses of an iterator and of a sink with the same
+    // numbers.
     if (status != BT_MESSAGE_ITERATOR_NEXT_STATUS_OK) return static_cast<Status>(status);
     auto& self = *static_cast<Sink*>(sink);
     for (std::uint64_t index = 0; index < count; ++index) {
@@ -163,7 +164,7 @@ std::string latestError() {
   return text;
 }
 
-// The directories of traces: each has a file "metadata".
+// Returns the directories that hold a trace. Each of them has a file "metadata".
 std::vector<std::string> traceDirectories(const std::filesystem::path& root) {
   // LTTng writes a trace of its own for each user and word size, in directories below the root.
   std::vector<std::string> directories;
