@@ -11,10 +11,10 @@
 namespace halvox::platform::linux_::defaults {
 
 // [listener] A local client authenticates within milliseconds. 30 seconds are enough on a machine
-// that swaps, and still free the descriptors of clients that connect and stay silent.
+// that swaps. The limit frees the descriptors of clients that connect and stay silent.
 inline constexpr std::chrono::seconds kHandshakeTimeout{30};
-// The time from the first byte of a message to its last. Longer than that of the handshake, because
-// a message may have 32 MiB.
+// The time from the first byte of a message to its last. Longer than kHandshakeTimeout, because a
+// message may have 32 MiB.
 inline constexpr std::chrono::seconds kMessageTimeout{60};
 // Permission bits of the socket of a system service: the audio programs of all users connect to it.
 inline constexpr std::uint32_t kSocketModeOfSystem = 0666;

@@ -54,7 +54,7 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
       mustWake = takeWakeUp();
     }
   }
-  // Do both after the lock is released: a thread that wakes up needs it at once.
+  // Do both after the lock is released: a thread that wakes up needs the lock at once.
   if (isNewForHelper) helper.noteQueueToHelp(shared_from_this());
   if (mustWake) wakeUp_.notifyOne();
 }

@@ -126,8 +126,8 @@ void SourceReader::makeReadings() {
     if (waiting_ > 0) std::swap(handedOver_, reading);
     made_.notifyAll();
     mutex_.unlock();
-    // Release it without the lock: that may call the source, which must not delay threads with
-    // requests.
+    // Release the reading without the lock: its destructor may call the source, which must not
+    // delay threads with requests.
     reading.reset();
     if (isSample) source_->sampled();
     mutex_.lock();

@@ -27,7 +27,7 @@ SqliteCode MessageBlocks::prepare(Database& database) {
   for (const auto& [statement, sql] :
        {std::pair<Statement*, std::string>{
             &statements_.insertBlock,
-            // The row may replace one without records, which keeps the next number.
+            // The row may replace the block without records that stores the next number.
             "INSERT OR REPLACE INTO message_blocks VALUES (?1, ?2, ?3, ?4, ?5)"},
         {&statements_.insertSpan, "INSERT OR REPLACE INTO message_spans VALUES (?1, ?2, ?3, ?4)"},
         {&statements_.newest, "SELECT id, records FROM message_blocks ORDER BY id DESC LIMIT 1"},

@@ -10,9 +10,9 @@
 
 namespace halvox::platform::linux_ {
 
-// The PipeWire source without PipeWire's library, until that is needed: it loads the module with
-// the source at the start of the service if there is a server's socket, and otherwise at the first
-// sample of a session. Until then the service does not map the library.
+// A PipeWire source that loads its module when it is needed: at the start of the service if the
+// socket of a server exists, and otherwise at the first sample of a session. Until then the service
+// does not map PipeWire's library.
 //
 //   waiting --socket at the start, or first sample--> loaded
 //      |

@@ -54,7 +54,8 @@ Result<void> SessionDaemon::start(const std::string& ownSessions) {
 
 void SessionDaemon::end() {
   if (!process_.has_value()) return;
-  // End the daemon first: its keeper would otherwise ask it for its sessions, and wait if it hangs.
+  // End the daemon first. Otherwise, the keeper would ask the daemon for its sessions, and would
+  // wait for a daemon that hangs.
   process_->end(limits_.endsWithin);
   keeper_.release();
   forget();
