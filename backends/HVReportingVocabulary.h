@@ -15,8 +15,8 @@ enum class ReporterID : std::int64_t {};
 // Identifies no session.
 inline constexpr ReporterID kNoReporterID{0};
 
-// What a message is about. The low 16 bits are the category proper. The high 16 bits may have one
-// domain, combined by `|`. Clients may send any value, including unlisted ones.
+// What a message is about. The low 16 bits are the category itself. `|` may add one domain in the
+// high 16 bits. Clients may send any value, including unlisted ones.
 enum class AudioEventCategory : std::uint32_t {
   kUndefined = 0,
   kGeneric = 1,

@@ -86,7 +86,8 @@ class Scene {
     dispatch_.runAll();
   }
 
-  // One token for all requests, whose count of holders changes as that of a request's own does.
+  // All requests share this token. Its reference count changes as often as that of a request's own
+  // token would.
   const platform::RequestContext context_{.sender = 100, .token = std::make_shared<int>()};
   bench::ListDispatch& dispatch_;
   std::shared_ptr<HVReportingServiceDelegate> delegate_;

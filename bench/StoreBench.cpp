@@ -142,7 +142,8 @@ std::string words(std::uint64_t number, int count) {
   return text;
 }
 
-// A message of a client that runs: a counter and the stamps change, or texts too.
+// A message of a running client. Each differs from the one before in a counter and the stamps, and
+// in its texts if `isVaried`.
 Dictionary messageOf(std::int64_t number, bool isVaried) {
   Dictionary message = bench::makeMessage(512 * number);
   if (isVaried) {
@@ -205,8 +206,9 @@ BENCHMARK(storeMessage)
     ->Unit(benchmark::kMicrosecond)
     ->UseRealTime();
 
-// The cost of a store that takes both events and the link message of each message: CPU of the whole
-// process beside that of making the messages, bytes written to disk, bytes of the closed file.
+// The cost of a store that takes both events and the link message of each message. Reports the CPU
+// time of the whole process without that of making the messages, the bytes written to disk, and the
+// size of the closed file.
 void storeAll(benchmark::State& state) {
   const bool isVaried = state.range(0) == 1;
   constexpr std::int64_t kMessages = 300'000;

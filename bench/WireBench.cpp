@@ -1,4 +1,4 @@
-// The cost of the single steps of reading a message from the wire and answering it.
+// The cost of each step of reading a message from the wire and answering it.
 
 #include <algorithm>
 #include <memory>

@@ -52,9 +52,9 @@ class DispatchQueue {
   virtual void async(JobWeight weight, Job job) = 0;
   // Waits on a semaphore of the same service without holding a thread. Only for jobs of shared
   // queues: a job of this queue calls it at most once, as the last thing that it does. The queue
-  // runs no other job until there is a signal, which it consumes, or until the time-out has passed
-  // (none: it waits without limit). Then it runs `then` ahead of the jobs that wait. `then` is a
-  // job like any other and may wait again.
+  // runs no other job until it has consumed a signal or the time-out has passed; without a time-out
+  // it waits without limit. Then it runs `then` ahead of its waiting jobs. `then` is a job like any
+  // other and may call waitOn() again.
   virtual void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
                       std::optional<std::chrono::nanoseconds> timeout,
                       std::function<void(WaitOutcome)> then) = 0;

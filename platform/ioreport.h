@@ -173,8 +173,8 @@ class IOReportMoment {
 // return returns null; it sets `error` if it knows why, and leaves it unchanged otherwise.
 //
 // A channel is the same in two samples if its names, format, kind, unit, states and bucket bounds
-// are equal and the driver did not withdraw it in between. A weaker condition would subtract counts
-// of different things.
+// are equal and the driver did not withdraw it in between. With a weaker condition, a difference
+// could be taken between counts of different things.
 class IOReportService {
  public:
   using Channels = std::shared_ptr<const IOReportChannels>;

@@ -92,8 +92,8 @@ class TLMReportingService {
   virtual void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) = 0;
   virtual TLMReportingOutcome TLMReportingSendMessage(const Session& session,
                                                       const TLMReportingMessage& message) = 0;
-  // True if a send only notes the message at the moment and does not wait for room. A thread that
-  // has requests to answer can then do it itself.
+  // True if a send at this moment would only queue the message, without waiting for room. A thread
+  // that has requests to answer can then send by itself.
   [[nodiscard]] virtual bool onlyNotesMessages() const { return false; }
   // Sends what the framework still holds for the session. `flushed` is called exactly once, when
   // that is done or given up; this may be before the call returns.

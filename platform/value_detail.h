@@ -49,7 +49,7 @@ struct KeyNode {
   [[nodiscard]] std::string_view view() { return {text(), length}; }
 };
 
-// A string that is too long to be in its value.
+// A string that is too long to be stored inside its Value.
 struct StringRep {
   ReferenceCount references;
   std::uint32_t length;

@@ -104,8 +104,8 @@ class HVReportingClientServerInstance final
   };
   // Messages that one job sends.
   using Messages = std::vector<MessageRequest>;
-  // Empty lists with room, for any client. They belong to the process: a client that once sent much
-  // must not hold memory for it.
+  // Empty lists with reserved room, for any client. They belong to the process: a client must not
+  // keep memory because it once sent much.
   static Guarded<std::vector<Messages>>& spareMessages();
 
   // Queues `work`, which is called with this client, on the reporting queue. Keeps the client and

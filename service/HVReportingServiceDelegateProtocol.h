@@ -39,8 +39,8 @@ class HVReportingServiceDelegateProtocol {
   // The started sessions: clients in the order of their registration, the sessions of one client in
   // no particular order. Logs the sessions of each client.
   [[nodiscard]] virtual Sessions getAllActiveReportingSessions() const = 0;
-  // The session with this ID. If several clients have one, that of the client registered first.
-  // Null if there is none, for ID 0, and while reporting is disabled.
+  // Returns the session with this ID. If several clients have such a session, returns that of the
+  // client that registered first. Null if there is none, for ID 0, and while reporting is disabled.
   [[nodiscard]] virtual std::shared_ptr<HVReportingSession> findReportingSessionForID(
       ReporterID reporterID) const = 0;
   // Removes a client from the list.

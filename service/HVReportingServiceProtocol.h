@@ -58,8 +58,8 @@ class HVReportingServiceProtocol : public platform::ExportedObject {
   virtual void postMessage(platform::Message message, AudioEventCategory category,
                            AudioEventType type, std::optional<platform::Array> reporterIDs,
                            platform::PostedRequest request, platform::ProcessID sender) = 0;
-  // Stops one of the client's own sessions, which stays and can be started again. The held reply of
-  // the start comes first, then this one.
+  // Stops one of the client's own sessions. The session stays and can be started again. The held
+  // reply of its start is called first, then `reply`.
   virtual void stopReportingSessionForID(ReporterID reporterID, BoolReply reply,
                                          RequestContext context) = 0;
   // Stops one of the client's own sessions if it is started, and drops it. The held reply of its

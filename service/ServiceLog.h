@@ -46,7 +46,7 @@ class ListDescription {
   Append append_;
 };
 
-// Describes a list of shared pointers to sessions, which must outlive the result.
+// Describes a list of shared pointers to sessions. The list must outlive the result.
 template <typename List>
 auto sessionsDescription(const List& sessions) {
   return ListDescription(

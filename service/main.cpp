@@ -35,8 +35,8 @@ int serve(const Configuration& configuration) {
     static_cast<void>(adapters.close());
     return refuse(opened.error().code, opened.error().message);
   }
-  // After the services are installed, which its constructor uses. Nothing is accepted before
-  // resume(), which returns when the service is asked to end.
+  // The constructor uses the installed services. No connection is accepted before resume(), which
+  // returns when the service is asked to end.
   const auto delegate = std::make_shared<HVReportingServiceDelegate>();
   platform::NSXPCListener& listener = platform::connections().serviceListener();
   listener.setDelegate(*delegate);

@@ -55,7 +55,7 @@ std::uint64_t integerOf(const Value& value, NumberKind kind) {
   return isSigned(kind) ? static_cast<std::uint64_t>(value.toInt64()) : value.toUInt64();
 }
 
-// The number that a difference starts from: that of a value of the same type, else 0.
+// The number that a difference is taken from: the previous number if it has the same type, else 0.
 std::uint64_t integerBefore(const Value& previous, NumberKind kind) {
   return previous.isNumber() && previous.numberKind() == kind ? integerOf(previous, kind) : 0;
 }

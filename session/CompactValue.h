@@ -44,9 +44,9 @@ class CompactWriter {
   std::vector<std::byte>& bytes_;
 };
 
-// Reads what a CompactWriter wrote, in the same order. At bytes that no CompactWriter writes the
-// reader stops being intact. Everything that it reads from then on is zero or empty. The bytes must
-// outlive it. Belongs to one thread.
+// Reads what a CompactWriter wrote, in the same order. Bytes that no CompactWriter writes are
+// damage: from then on isIntact() is false, and everything that is read is zero or empty. The bytes
+// must outlive the reader. Belongs to one thread.
 class CompactReader {
  public:
   explicit CompactReader(std::span<const std::byte> bytes) : bytes_(bytes) {}
@@ -55,9 +55,9 @@ class CompactReader {
   [[nodiscard]] bool isAtEnd() const { return position_ == bytes_.size(); }
   [[nodiscard]] std::size_t position() const { return position_; }
   std::uint64_t number();
-  // The number of things that follow. Each takes at least a byte: after a number larger than the
-  // remaining bytes the reader is not intact, and 0 is returned. The caller may therefore reserve
-  // memory for them.
+  // The number of items that follow. Each takes at least a byte: a number larger than that of the
+  // remaining bytes is damage, for which 0 is returned. The caller may therefore reserve memory for
+  // the items.
   std::size_t count();
   // The results of both are valid as long as the bytes.
   std::span<const std::byte> bytes(std::size_t length);
@@ -65,7 +65,8 @@ class CompactReader {
   platform::Value value(const platform::Value& previous);
   // Entries with their keys.
   platform::Dictionary dictionary();
-  // Makes the reader not intact. For a caller to whom the bytes make no sense.
+  // Marks the bytes as damaged: isIntact() is false from now on. For a caller that finds a value
+  // that cannot be right.
   void giveUp();
 
  private:

@@ -16,8 +16,8 @@ namespace {
 using platform::Dictionary;
 using platform::Message;
 
-// The category and type of the summary event: all bits set. Neither is in the vocabulary's tables;
-// both are required. Their texts are "Undefined" and "Unknown".
+// The category and type of the summary event have all bits set. These values are required, although
+// the vocabulary's tables do not list them. Their texts are "Undefined" and "Unknown".
 constexpr AudioEventCategory kSummaryCategory{0xFFFFFFFF};
 constexpr AudioEventType kSummaryType = AudioEventType::kUnknown;
 

@@ -29,13 +29,13 @@ class LinkDiscovery {
   // the framework may hold this object for ever.
   explicit LinkDiscovery(Report report) : report_(std::move(report)) {}
 
-  // The start job has logged that it waits. Call once, from that job.
+  // Call once, from the start job, after it has logged that it waits.
   void awaitAnswer();
   // Call once, on the framework's thread.
   void answer(const Backends& backends);
 
  private:
-  // True for the second of the two calls.
+  // True for the second of awaitAnswer() and answer().
   bool isSecondCall() { return wasCalled_.exchange(true, std::memory_order_acq_rel); }
 
   const Report report_;

@@ -15,9 +15,9 @@ using platform::Value;
 // Bounds the table of codes, because a client can invent any number of categories and types. A base
 // whose code is not in the table is found by its text. No honest client needs so many codes.
 constexpr std::size_t kMaxBasesByCode = 4096;
-// Bounds what each form costs: the memory of its last message, and the time of comparing its keys
-// with those of a message. A message whose keys no form has, and that gets no new one, is written
-// with its keys.
+// Bounds the number of forms. Each costs the memory of its last message, and the time of comparing
+// its keys with those of a message. At the bound, a message with other keys gets no form and is
+// written with its keys.
 constexpr std::size_t kMaxForms = 256;
 constexpr std::size_t kMaxFormsOfBase = 8;
 // Estimated bytes of a node and a bucket of a hash table.
@@ -241,8 +241,8 @@ void MessageHistory::Reader::giveUp() {
                                           std::to_string(position_) + " on"};
 }
 
-// Returns true if the entry was a message. If the bytes are damaged, what it returns or sets has no
-// meaning, and the reader of bytes is not intact.
+// Returns true if the entry was a message. If the bytes are damaged, `reader` is not intact, and
+// what this returns or sets has no meaning.
 bool MessageHistory::Reader::read(CompactReader& reader) {
   const std::uint64_t kind = reader.number();
   if (kind >= kFirstForm) {

@@ -7,7 +7,7 @@
 namespace halvox {
 namespace {
 
-// Bytes of one history that are moved out at once, at least: moving fewer costs more than it saves.
+// The fewest bytes of one history that are moved out: moving fewer costs more than it saves.
 constexpr std::size_t kLeastToMove = 4 * 1024;
 // Bytes that one history may hold in memory: tens of thousands of ordinary messages, so that most
 // sessions never touch the disk.

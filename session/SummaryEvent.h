@@ -16,7 +16,7 @@ namespace halvox {
 //
 // Keeps one growing text for each key instead of lists of values: a long history then takes only
 // the memory of the texts. Keys keep the order of their first use; the service type is first.
-// Belongs to one thread; made and used up by one stop.
+// Belongs to one thread. Each stop makes its own.
 class SummaryEvent {
  public:
   explicit SummaryEvent(AudioServiceType serviceType);

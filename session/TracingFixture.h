@@ -59,7 +59,7 @@ class TracingFixture : public testing::Test {
   }
   // Runs what the back-ends do on their own queues.
   void letRun() { platform_.dispatch.runUntilIdle(); }
-  // The operations that both back-ends were asked for.
+  // The operations that the trace back-ends were asked for.
   Texts operations() const { return platform_.journal.texts(JournalKind::kNote); }
   // The lines of one level and category.
   Texts lines(LogLevel level, std::string_view category) const {

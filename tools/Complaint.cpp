@@ -35,8 +35,8 @@ void Complaint::warn(std::string_view what) const {
 
 ExitStatus Complaint::operator()(ExitStatus status, std::string_view what,
                                  std::string_view kind) const {
-  // The line for people comes first in both forms: with --json it is on standard error, the object
-  // on standard output.
+  // Both forms begin with the line for people. With --json an object follows: the line goes to
+  // standard error, the object to standard output.
   warn(what);
   if (form_ == OutputForm::kJson) {
     const FailureText failure{kind.empty() ? failureKind(status) : kind, "", what};

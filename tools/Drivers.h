@@ -16,8 +16,8 @@ struct ShowDrivers {
   std::optional<std::chrono::milliseconds> watch{};
 };
 
-// Formats one channel on one line, without a line end. With `seconds` the counts are those of that
-// time and are shown per second; otherwise they are shown as they are.
+// Formats one channel on one line, without a line end. If `seconds` is set, the counts are those of
+// that many seconds and are shown per second. Otherwise they are shown as they are.
 std::string formatChannel(const platform::IOReportChannel& channel, std::optional<double> seconds,
                           OutputForm form);
 

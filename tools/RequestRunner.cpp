@@ -71,7 +71,8 @@ class RequestRunner::Execution {
   }
   ExitStatus operator()(const Start& request) {
     const auto started = connection_->startReportingSessionForID(request.id);
-    // The request returns when the service has carried the start out. Its answer comes at the stop.
+    // The call returns after the service has started the session. The service sends its reply to
+    // the start when the session stops.
     if (!started || !request.wait) return report("start", request.id, started);
     return reportWait("start", request.id, *request.wait);
   }

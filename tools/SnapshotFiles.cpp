@@ -48,7 +48,7 @@ std::variant<fs::path, ExitStatus> findSnapshot(const std::string& file,
   if (all.empty()) {
     std::error_code error;
     // An empty list has two causes: there is no snapshot, or this user may not read the directory.
-    // Opening it again tells them apart.
+    // Opening the directory again tells the causes apart.
     const fs::directory_iterator opened(directory.path(), error);
     if (error && error != std::errc::no_such_file_or_directory) {
       return complain(ExitStatus::kNoService, directory.path().native() + ": " + error.message(),

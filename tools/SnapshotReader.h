@@ -27,7 +27,8 @@ enum class ExistingFiles : std::uint8_t { kRefuse, kReplace };
 // It is an error if the snapshot holds anything but plain files and directories, a name leads out
 // of the directory, a symbolic link is in the way, or a file exists and `existing` is kRefuse.
 // Errors that the archive itself shows are found before anything is unpacked, and no directory is
-// left behind. An error while writing, such as a full disk, leaves the files before it.
+// left behind. After an error while writing, such as a full disk, the files that were written
+// before remain.
 //
 // Changes the working directory of the process while it runs: no other thread may use relative
 // paths.

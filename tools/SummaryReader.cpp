@@ -31,7 +31,7 @@ constexpr std::string_view kEnding = ".json";
 constexpr std::string_view kTimestampKey = "hvreporting_timestamp";
 constexpr std::string_view kVolumeInterval = "Volume_Summary_";
 constexpr std::size_t kBufferBytes = 64 * 1024;
-// Far deeper than any message of the service.
+// Both are far beyond any message of the service.
 constexpr std::size_t kLongestMessage = 64 * 1024 * 1024;
 constexpr std::size_t kDeepestNesting = 256;
 

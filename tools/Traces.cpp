@@ -200,7 +200,7 @@ class TracedSession {
     return failure;
   }
 
-  // Returns after the results are written. Returns why they may be missing, or nothing.
+  // Returns after the service has written the results: an empty text, or why they may be missing.
   std::string stop() {
     const auto stopped = connection_->stopReportingSessionForID(id_);
     if (!stopped) return stopped.failure->message;

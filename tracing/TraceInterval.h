@@ -17,8 +17,8 @@ struct TraceIntervalCodes {
 // Measures the nanoseconds from each begin event to the end event that follows it.
 //
 // An event that is both counts as a begin. A begin that another begin follows is discarded, and so
-// is an end without a begin; the numbers are logged. State between events lives only during one
-// pass. Owner and thread are those of TraceData.
+// is an end without a begin; the counts of both are logged. State between events lives only during
+// one pass. Owner and thread are those of TraceData.
 class TraceInterval : public TraceData {
  public:
   TraceInterval(std::string name, TraceIntervalCodes codes)

@@ -12,7 +12,7 @@ namespace halvox::bench {
 // until a signal ends the process. Returns 1 if it cannot listen.
 int serveSink(const std::string& socketPath);
 
-// Such a server in a process of its own, which ends with this object. Make it before the first
+// Runs serveSink() in a process of its own, which the destructor ends. Make it before the first
 // thread, because it forks. The constructor waits until the server listens.
 class SinkProcess {
  public:

@@ -127,8 +127,8 @@ Cost runRsyslog(const Options& options, bool variesTexts) {
   });
 }
 
-// The time until the last answer counts as the service's throughput: what it has answered waits in
-// a queue of bounded size at most half a second for the store.
+// The service's throughput counts until its last answer, not until the last message is stored. A
+// message that was answered waits for the store at most half a second, in a bounded queue.
 Cost runService(const Options& options, const std::string& settings, bool variesTexts) {
   const Service service(options, settings);
   std::vector<std::unique_ptr<RawClient>> clients;

@@ -95,8 +95,8 @@ void measureThroughput(const LoadOptions& options, std::vector<Measurement>& res
   std::vector<Cost> stored;
   std::vector<Cost> unwanted;
   for (int round = 0; round < options.rounds; ++round) {
-    // One run of each kind a round: other work on the machine then changes all of them, and the
-    // ratios less.
+    // Each round has one run of each kind: other work on the machine then affects all kinds alike,
+    // and their ratios little.
     echo.push_back(oneRun(options, ServerKind::kEcho));
     linked.push_back(oneRun(options, ServerKind::kStored, kLocalLink));
     stored.push_back(oneRun(options, ServerKind::kStored));

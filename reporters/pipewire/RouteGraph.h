@@ -10,7 +10,8 @@
 
 namespace halvox::pipewire_reporter {
 
-// PipeWire's ID of a global object. The server uses it again after the object was removed.
+// PipeWire's ID of a global object. The server may give the ID to another object after this one was
+// removed.
 using GlobalID = std::uint32_t;
 
 // The devices that a stream is linked to: each once, sorted by name.

@@ -190,7 +190,7 @@ void StreamSession::sendVolumeIfChanged() {
     return;
   }
   sentVolume_ = state;
-  // PipeWire does not say which process changed a volume. Name the stream's own.
+  // PipeWire does not say which process changed a volume. Report the process of the stream.
   send({{kVolumeKey, state.volume},
         {kPlayingKey, state.playing ? 1 : 0},
         {kVolumeProcessKey, process_}},

@@ -17,7 +17,8 @@
 
 namespace halvox::pipewire_reporter {
 
-// Returns the direction of a stream by the media class of its node; std::nullopt for other nodes.
+// Returns the direction that the media class of a stream's node implies; std::nullopt if the node
+// is not a stream.
 std::optional<Direction> streamDirection(std::string_view mediaClass);
 
 // Makes the identifier of a stream's session: 0x5057 ("PW") in the upper 16 bits, then the lower 16

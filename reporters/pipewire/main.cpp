@@ -20,7 +20,7 @@ namespace {
 
 using namespace halvox::pipewire_reporter;  // the program's own
 
-// Wrong arguments as in halvoxctl, the others as in sysexits.h.
+// The status of wrong arguments is that of halvoxctl; the others are those of sysexits.h.
 constexpr int kExitUsage = 2;
 constexpr int kExitSoftware = 70;
 constexpr int kExitConfiguration = 78;
@@ -94,8 +94,8 @@ void run(const Arguments& arguments) {
     wasLost = wasLost || !connected;
   });
   {
-    // Destroyed before the flush: its end stops all sessions, and the flush waits for their last
-    // messages.
+    // Destroyed before the flush: the destructor stops all sessions, and the flush waits for their
+    // last messages.
     const StreamWatcher watcher(
         loop.handle(), tracker,
         {.remote = arguments.remote, .log = logLine, .xruns = !arguments.noXruns});

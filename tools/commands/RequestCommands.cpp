@@ -114,7 +114,7 @@ void addStart(CommandSet& commands) {
 }
 
 Send makeSend(const Arguments& given) {
-  // Neither is assumed: the command cannot know which sessions are meant.
+  // --all is not the default without --id: the command cannot know which sessions are meant.
   if (given.isToAll == !given.ids.empty()) {
     throw CLI::ValidationError(
         "--id",

@@ -18,8 +18,8 @@ namespace halvox::platform::contract {
 // What every TLMReportingService promises. `Harness` has
 //   TLMReportingService& service();
 //   bool letRunUntil(const std::function<bool()>& condition);  // false if it never becomes true
-//   static constexpr bool kFindsBackends;   // whether a discovery finds any
-//   static constexpr bool kTakesMessages;   // whether a message is taken
+//   static constexpr bool kFindsBackends;   // whether a discovery finds back-ends
+//   static constexpr bool kTakesMessages;   // whether a message is accepted
 //   std::vector<std::int64_t> arrived();    // the numbers of the messages that arrived, in order
 //   void breakSending();                    // makes the service refuse messages
 // and, if it needs a server, static bool isAvailable(); without the server the suite is skipped.
