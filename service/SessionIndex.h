@@ -33,7 +33,8 @@ class SessionIndex {
   // Records a change of a client's session. Ignored for a client that is not registered.
   void noteChange(const Client& client, const Session& session, SessionChange change);
 
-  // The session with this ID. If several clients have one, that of the client registered first.
+  // Returns the session with this ID. If several clients have such a session, returns that of the
+  // client that registered first.
   [[nodiscard]] Found find(ReporterID reporterID) const;
   // All started sessions, in the order in which their clients were registered.
   [[nodiscard]] std::vector<Session> activeSessions() const;

@@ -7,7 +7,7 @@
 #include "client/HalvoxClient.h"
 #include "platform/linux/base/Result.h"
 
-// Converts the texts of single arguments to values. On failure the message says what was found and
+// Converts the text of an argument to a value. On failure the message says what was found and
 // what was expected. Pure functions: any thread may call.
 namespace halvox::tools {
 

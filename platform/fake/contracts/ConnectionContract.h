@@ -97,7 +97,7 @@ inline const NSXPCInterface& contractInterface() {
   return kInterface;
 }
 
-// Exports a new object for each client, and notes the events of connections.
+// Exports a new object for each client, and records the events of connections.
 class ContractDelegate final : public NSXPCListenerDelegate {
  public:
   bool listenerShouldAcceptNewConnection(

@@ -61,8 +61,8 @@ Result<BusSession, ConnectionOpenError> BusConnector::connect(const std::string&
   const auto ignore = [](const Value&) -> Outcome { return {}; };
   if (Outcome done = call("Hello", "", {}, "s", ignore); !done) return std::move(done).error();
   const std::array rule = {Value(kVanishingNames)};
-  // Ask for these signals before the name. Once the name is ours, a sender can call and leave, and
-  // its end must not be missed.
+  // Ask for these signals before the name. Once the name is ours, a sender can call and leave. The
+  // signal of its leaving must not be missed.
   if (Outcome done = call("AddMatch", "s", rule, "", ignore); !done) return std::move(done).error();
   if (Outcome done = requestName(); !done) return std::move(done).error();
   const std::span<const std::byte> rest = input_.unused();

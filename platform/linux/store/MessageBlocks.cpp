@@ -7,8 +7,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Enough records for a block: those of 85 messages with two events and a link message each. Blocks
-// of 32 messages take twice the bytes of blocks of 340.
+// Enough records for a block: 85 messages with two events and a link message each. Messages take
+// twice as many bytes in blocks of 32 messages as in blocks of 340.
 constexpr std::uint64_t kRecordsToSeal = 256;
 // An open row with fewer records fits into the page that its commit writes anyway.
 constexpr std::uint64_t kRecordsToCompress = 24;

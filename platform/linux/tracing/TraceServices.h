@@ -61,7 +61,7 @@ struct TraceOptions {
 [[nodiscard]] bool hasTraceLeftovers(const std::filesystem::path& tracesDirectory);
 
 // Names in the directory of traces: the directory of the traces being recorded, and the file that
-// notes the tracer's daemon.
+// names the tracer's daemon.
 inline constexpr const char* kTraceScratch = "scratch";
 inline constexpr const char* kTraceDaemonNote = "lttng-sessiond";
 

@@ -36,10 +36,9 @@ struct CallTarget {
 // range becomes the nearest end of the range. Any number can be a boolean. `(d)` takes a date, `ay`
 // data or an array of numbers, `a{s…}` a dictionary, other arrays an array, `o` and `g` a string
 // that is valid as such. Other structs, file descriptors, dictionaries with other keys and the
-// absent value cannot be encoded. A variant gets the natural type of its value: that of the
-// number's kind
-// (`d` for a float), `s`, `(d)`, `ay`, `a{sv}`. An array whose elements have one type is an array
-// of that type, any other is `av`.
+// absent value cannot be encoded. The type of a variant follows
+// from its value: for a number its kind (`d` for a float), else `s`, `(d)`, `ay` or `a{sv}`. An
+// array whose elements have one type is an array of that type, any other is `av`.
 [[nodiscard]] bool appendMethodReturn(std::string& out, const ReplyTo& replyTo,
                                       std::uint32_t serial, std::string_view signature,
                                       const Value& value);

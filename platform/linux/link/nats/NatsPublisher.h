@@ -81,7 +81,7 @@ class NatsPublisher {
   NatsPublisher& operator=(const NatsPublisher&) = delete;
   ~NatsPublisher() = default;
 
-  // Counts a message that a session sends, before it is taken or refused.
+  // Counts a message that a session sends, before it is queued or refused.
   void countReceived() { received_.add(); }
   // Queues the message and moves from it. If the queue is full, returns the error and leaves
   // `message` unchanged.

@@ -17,9 +17,9 @@ namespace halvox::platform::linux_ {
 //   not ours --start() or adopt()--> ours --end() or leave()--> not ours
 //
 // The daemon must not outlive the service, however the service ends, unless others use it. Its
-// keeper (TracerKeeper) ensures that. A file notes the process, so that a later service recognises
-// a daemon that stayed because others used it. A process is signalled only while its start time is
-// the noted one.
+// keeper (TracerKeeper) ensures that. A file names the process: a later service then recognises a
+// daemon that stayed because others used it. A process is signalled only if its start time is the
+// one in the file.
 class SessionDaemon {
  public:
   struct Limits {

@@ -4,8 +4,8 @@
 // service that started the keeper lives. If PID and STARTTIME name a process, that is the daemon;
 // otherwise the keeper starts one.
 //
-// It notes the daemon in the file NOTE and prints the same line on standard output. If there is no
-// daemon, it prints a line with the reason and exits with status 1.
+// It records the daemon in the file NOTE and prints the same line on standard output. If there is
+// no daemon, it prints a line with the reason and exits with status 1.
 //
 // At the end of input it destroys the sessions whose names begin with SESSIONS. Then it ends the
 // daemon, unless others have sessions in it.
