@@ -13,7 +13,8 @@ namespace halvox {
 namespace {
 
 constexpr int kKilledExitStatus = 2;
-// Enough for the requests that wait while a stop takes its time, and for all of one read.
+// Bounds the spare lists of messages, and the messages that each has room for. A list holds the
+// messages of one read. Several lists are in use while a stop takes long and requests wait.
 constexpr std::size_t kMostSpares = 4;
 constexpr std::size_t kMostSpareMessages = 128;
 
@@ -74,8 +75,8 @@ void HVReportingClientServerInstance::setClientProcessName(std::optional<std::st
 
 HVReportingClientServerInstance::Session HVReportingClientServerInstance::findReportingSessionForID(
     ReporterID reporterID, Lookup lookup) const {
-  // ID 0 is not excluded: a client may have created a session under it. Requests that exclude it do
-  // so themselves.
+  // ID 0 is not excluded here, because a client may have created a session under it. Requests that
+  // exclude ID 0 test for it themselves.
   if (const auto own = sessions_.find(reporterID); own != sessions_.end()) return own->second;
   if (lookup == Lookup::kOwnSessions) return nullptr;
   const Delegate delegate = delegate_.lock();
@@ -84,12 +85,14 @@ HVReportingClientServerInstance::Session HVReportingClientServerInstance::findRe
 
 // The job holds the client, so that the requests of a connection that has ended are still carried
 // out. It also holds the request's token, by which the connection knows how many of its requests
-// are open. A request with a dictionary charges it before it is queued: the client's next request
-// is then checked against what this one will make the service hold.
+// are open. A request with a dictionary charges the dictionary to its client before it is queued.
+// The check of the client's next request then includes what this request will make the service
+// hold.
 template <typename Work>
 void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
                                                    RequestContext&& context, Work work) {
-  // Requests are carried out in the order of their arrival.
+  // Messages that arrived before this request are queued first, because requests are carried out in
+  // the order of their arrival.
   endOfRequests();
   counters_->requests.received.add();
   reportingQueue()->async(weight, [client = shared_from_this(), token = std::move(context.token),
@@ -184,13 +187,14 @@ void HVReportingClientServerInstance::postMessage(platform::Message message,
     }
   }
   ResourceCharge charge(account_, message ? message->memorySize() : 0);
-  // Looked up here, on the connection's thread: when the job runs, the sender may have ended.
+  // The sender's name is looked up here, on the connection's thread, because the sender may have
+  // ended by the time the job runs.
   posted_.push_back({std::move(message), category, type, std::move(reporterIDs),
                      senderProcessName(type, sender), std::move(request), std::move(charge)});
 }
 
-// One job for all messages that one read of the socket gave. A job for each message, with its token
-// and its reply, takes six allocations.
+// Queues one job for all messages that one read of the socket gave. A job for each message, with
+// its token and its reply, would take six allocations.
 void HVReportingClientServerInstance::endOfRequests() {
   if (posted_.empty()) return;
   reportingQueue()->async(platform::JobWeight::kBrief,
@@ -203,14 +207,14 @@ void HVReportingClientServerInstance::endOfRequests() {
 void HVReportingClientServerInstance::carryOutSends(Messages& messages) {
   std::exception_ptr failure;
   for (MessageRequest& message : messages) {
-    // Release each message as soon as it is sent: the client's next requests are read only while
-    // few are open.
+    // Moved out of the list, to be released as soon as it is sent: the client's next requests are
+    // read only while few requests are open.
     MessageRequest request = std::move(message);
     try {
       carryOutSend(request);
       counters_->requests.carriedOut.add();
     } catch (...) {
-      // The queue logs it. The other messages of the job are sent all the same.
+      // The queue logs the exception. The other messages of the job are still sent.
       failure = std::current_exception();
     }
   }

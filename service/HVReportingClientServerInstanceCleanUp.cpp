@@ -11,8 +11,8 @@ namespace halvox {
 void HVReportingClientServerInstance::putSession(const Session& session, const Delegate& delegate) {
   session->chargeTo(account_);
   Session& place = sessions_[session->reporterID()];
-  // A session that was there is dropped without being stopped, even if it is started. This is
-  // required.
+  // A session that already has this ID is dropped without being stopped, even if it is started.
+  // This is required.
   if (place != nullptr) note(place, SessionChange::kRemoved, delegate);
   place = session;
   note(session, SessionChange::kAdded, delegate);
@@ -32,8 +32,8 @@ void HVReportingClientServerInstance::note(const Session& session, SessionChange
 }
 
 void HVReportingClientServerInstance::handleConnectionError() {
-  // Not brief, because it stops sessions. The job holds the client: the connection may release it
-  // first.
+  // The job is not brief, because it stops sessions. It holds the client, because the connection
+  // may release the client before the job runs.
   reportingQueue()->async(platform::JobWeight::kMayBlock,
                           [client = shared_from_this()] { client->carryOutConnectionError(); });
 }
@@ -41,7 +41,7 @@ void HVReportingClientServerInstance::handleConnectionError() {
 void HVReportingClientServerInstance::carryOutConnectionError() {
   const Delegate delegate = delegate_.lock();
   if (delegate == nullptr) return;
-  // An interruption and the end of the connection both lead here. The second finds the client
+  // An interruption and the end of the connection both lead here. The second call finds the client
   // removed and does nothing.
   const auto& clients = delegate->getAllClients();
   if (std::ranges::none_of(clients, [this](const auto& one) { return one.get() == this; })) return;
@@ -50,7 +50,7 @@ void HVReportingClientServerInstance::carryOutConnectionError() {
   for (const auto& [reporterID, session] : sessions_) {
     if (session->started()) session->stop();
   }
-  // Only after all of them have been stopped; this order is required.
+  // Sessions are removed only after all of them have been stopped; this order is required.
   while (!sessions_.empty()) removeSession(sessions_.begin(), delegate);
   delegate->removeClient(*this);
   kServiceLog.notice("removing ", processIdentifier_, " from the server client list");

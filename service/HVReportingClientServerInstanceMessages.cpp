@@ -37,13 +37,14 @@ class ReporterIDsDescription {
 };
 
 // Adds the time of arrival to the message. Removes what the client sent under these keys first, so
-// that the stamps become the last entries. Sessions replace blanks in keys and keep the later of
-// two equal keys: a client's "systemuptime sec" does not displace a stamp.
+// that the stamps become the last entries. They must be last, because sessions replace blanks in
+// keys and keep the later of two equal keys: a client's "systemuptime sec" must not displace a
+// stamp.
 void stamp(platform::Message& message) {
   static const platform::Key timestamp("hvreporting_timestamp");
   static const platform::Key systemUptime("systemuptime_sec");
   static const platform::Key processUptime("processuptime_ms");
-  // The stamps, and the tag that a session adds.
+  // The three stamps, and the tag that a session adds.
   constexpr std::size_t kAddedEntries = 4;
   if (!message.has_value()) return;
   const platform::ClockService& clock = platform::clock();
@@ -81,8 +82,8 @@ void HVReportingClientServerInstance::sendToNamedSessions(const MessageRequest& 
   bool delivered = false;
   for (const platform::Value& value : *request.reporterIDs) {
     const auto reporterID = static_cast<ReporterID>(value.toInt64());
-    // An ID that is unknown is skipped silently, and one that is named twice gets the message
-    // twice. Both are required.
+    // An unknown ID is skipped silently. A session that is named twice gets the message twice. Both
+    // are required.
     if (reporterID == kNoReporterID) continue;
     const Session session = findReportingSessionForID(reporterID, Lookup::kAcrossAllClients);
     if (session == nullptr) continue;
@@ -103,7 +104,8 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
     sendStandalone(request, delegate);
     return;
   }
-  // Here the session comes first; for named sessions it comes last. Both orders are required.
+  // Here the session gets the message before the back-ends; a named session gets it after them.
+  // Both orders are required.
   for (const Session& session : sessions) {
     session->sendMessage(request.message, request.category, request.type, nullptr, account_);
     handToBackEnds(request, session, delegate);
@@ -112,8 +114,8 @@ void HVReportingClientServerInstance::sendToActiveSessions(const MessageRequest&
 
 void HVReportingClientServerInstance::sendStandalone(const MessageRequest& request,
                                                      const Delegate& delegate) const {
-  // The back-ends need a session: a message without one gets a temporary one. It is never started
-  // and enters no map; the queued payloads hold it until they are built.
+  // The back-ends need a session. A message that no session takes gets a temporary session, which
+  // is never started and enters no map. The queued payloads hold it until they are built.
   const auto session = std::make_shared<HVReportingSession>(
       kStandaloneReporterID,
       HVReportingSession::ProcessIdentifiers{platform::process().ownProcessIdentifier()},

@@ -129,7 +129,7 @@ void HVReportingClientServerInstance::begin(const Session& session, const Delega
   session->setTlmReportingEnabled(mayUseLink(delegate));
   session->start();
   note(session, SessionChange::kStarted, delegate);
-  // After the start: the report covers only what the drivers count from here on.
+  // Taken after the start: the driver report covers only what the drivers count from here on.
   if (delegate != nullptr) session->setDriverSnapShot(delegate->getSnapShot());
   deliverHeldReply(*session, *counters_);
   counters_->startReplies.heldBack.add();
@@ -194,12 +194,13 @@ void HVReportingClientServerInstance::carryOutReporterIDValid(ReporterID reporte
     result.set("reporterID", number(reporterID));
     result.set("serviceType", number(session->serviceType()));
   }
-  // The same text as above; tools match both.
+  // The same text is logged twice, at two levels; tools match both lines.
   kServiceLog.notice("validating reporter ", number(reporterID));
   reply(std::nullopt, result);
 }
 
-// Lists sessions that are not started, too. The only request that logs nothing. Both are required.
+// Lists sessions that are not started, too. This is the only request that logs nothing. Both are
+// required.
 void HVReportingClientServerInstance::carryOutGetAllReporters(const ReportersReply& reply) const {
   std::vector<ReporterID> reporters;
   if (const Delegate delegate = delegate_.lock()) {

@@ -136,7 +136,7 @@ TEST_F(HVReportingClientServerInstanceStartStopTest, ATracingTestRepliesAtOnceAn
 
   const Call started = start(client_, 7);
   EXPECT_THAT(started->replies(), ElementsAre(ok(true)));
-  // After the features are read and before the active sessions are listed.
+  // The first reply comes after the features are read and before the active sessions are listed.
   ASSERT_GE(steps().size(), 10U);
   EXPECT_EQ(steps()[8], "getting features");
   EXPECT_EQ(steps()[9], "startReportingSessionForID");

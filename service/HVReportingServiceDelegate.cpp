@@ -39,7 +39,8 @@ platform::Value clientUptime(const std::optional<platform::Date>& start, platfor
     return kUnknownUptime;
   }
   if (start->secondsSince1970 > now.secondsSince1970) {
-    // The date lies in the future. The wording is part of the interface: tools match it.
+    // The date lies in the future, although the line says the opposite. The wording is part of the
+    // interface: tools match it.
     kServiceLog.notice("clientStartDate is in the past. clientpid=", pid,
                        " clientprocessname=", shownName);
   }
@@ -104,9 +105,9 @@ bool HVReportingServiceDelegate::listenerShouldAcceptNewConnection(
     const std::shared_ptr<platform::NSXPCConnection>& connection) {
   const platform::ProcessID pid = connection->processIdentifier();
   kServiceLog.notice("newConnection: ", connection->description());
-  // The client is queued for registration before the connection is resumed: its first request then
-  // finds it registered, since the queue is serial. Everything here holds the client weakly, so
-  // that the connection alone keeps it until then.
+  // The registration is queued before the connection is resumed. The queue is serial, and therefore
+  // the client's first request finds the client registered. Everything here holds the client
+  // weakly, so that the connection alone keeps it until the registration.
   const WeakClient weakClient = exportClient(*connection);
   reportingQueue()->async(platform::JobWeight::kBrief, [delegate = shared_from_this(), weakClient] {
     if (const Client client = weakClient.lock()) {
@@ -185,7 +186,7 @@ std::shared_ptr<HVReportingSession> HVReportingServiceDelegate::findReportingSes
 }
 
 void HVReportingServiceDelegate::removeClient(const HVReportingClientServerInstance& client) {
-  // The index first: erasing the client from the list may release it.
+  // The index is updated first, because erasing the client from the list may release it.
   index_.removeClient(client, sessionsOf(client));
   std::erase_if(clients_, [&client](const Client& one) { return one.get() == &client; });
 }
@@ -209,7 +210,8 @@ void HVReportingServiceDelegate::handleEventForVEK(
     const std::shared_ptr<HVReportingSession>& session,
     std::optional<std::string_view> processName) {
   if (!HVReportingUtilityIsInternalBuild()) return;
-  // Not null here: the answer about internal builds never changes within a process.
+  // `vekStateManager_` is not null here, because the answer about internal builds never changes
+  // within a process.
   vekStateManager_->handleEvent(message, category, type, session, processName);
 }
 

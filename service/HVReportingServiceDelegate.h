@@ -98,8 +98,8 @@ class HVReportingServiceDelegate final
   void handleFeatureChange(platform::NotifyToken token);
 
   // Held while a connection is prepared and while a session is looked up across clients, and
-  // nowhere else. It guards no data: the list of clients and the index belong to the reporting
-  // queue. A recursive lock is required here all the same.
+  // nowhere else. It guards no data, because the list of clients and the index belong to the
+  // reporting queue. A recursive lock is required here nevertheless.
   mutable std::recursive_mutex lock_;
   Clients clients_;     // reporting queue only
   SessionIndex index_;  // reporting queue only
@@ -112,8 +112,8 @@ class HVReportingServiceDelegate final
   std::unique_ptr<const HVReportingDriverUtility> driverUtility_;
   // Null on builds that are not internal. Reporting queue only.
   std::unique_ptr<HVReportingUtilityVEKStateManager> vekStateManager_;
-  // Expires with this object. The handlers that refer to it are registered for the life of the
-  // process: they check this first.
+  // Expires with this object. Handlers that refer to this object stay registered for the life of
+  // the process, and check first whether this pointer has expired.
   const std::shared_ptr<const bool> alive_ = std::make_shared<bool>(true);
 };
 

@@ -55,7 +55,7 @@ Dictionary HVReportingServiceDelegate::HVReportingDefaults() {
     // A value without a text counts as missing.
     if (auto name = store.stringForKey(kDeviceNameKey)) defaults.set(kDeviceNameKey, *name);
   }
-  // In spite of its name the value disables nothing: it is only handed on. Without a setting it is
+  // In spite of its name the value disables nothing: it is only passed on. Without a setting it is
   // the number 0, not false. Both are required.
   if (store.objectForKey(kDisableReportingKey).has_value()) {
     defaults.set(kDisableReportingKey, store.boolForKey(kDisableReportingKey));
@@ -84,7 +84,7 @@ platform::Message HVReportingServiceDelegate::getFeaturesState() const {
     auto value = platform::preferences().CFPreferencesCopyValue(feature, domain, kUserName);
     if (value.has_value()) state.set(feature, *std::move(value));
   }
-  // Tested before the time stamps are added, which are not a setting.
+  // Tested before the time stamps are added, because they are not settings.
   if (state.empty()) return std::nullopt;
   stamp(state);
   return state;
@@ -106,14 +106,15 @@ void HVReportingServiceDelegate::listenForFeatureStateChanges() {
         [this, alive = std::weak_ptr<const bool>(alive_)](platform::NotifyToken fired) {
           if (!alive.expired()) handleFeatureChange(fired);
         });
-    // Stored after a failure too, as 0. A failed registration is not tried again; this is required.
+    // The token of a failed registration, which is 0, is stored too. A failed registration is not
+    // tried again; this is required.
     descriptor.set(kNotifyTokenKey, token);
     kServiceLog.notice("notify setup result ", status, " token ", token);
   }
 }
 
 // Sends the state even if no watched setting has a value, so that sessions learn that the last
-// setting was removed. A session start sends nothing then. Both rules are required.
+// setting was removed. The start of a session sends nothing in this case. Both rules are required.
 void HVReportingServiceDelegate::handleFeatureChange(platform::NotifyToken token) {
   kServiceLog.info("feature ", token, " changes");
   const platform::Message state = getFeaturesState();

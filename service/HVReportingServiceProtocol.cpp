@@ -30,7 +30,8 @@ HVReportingServiceProtocol& service(ExportedObject& object) {
 
 ReporterID reporterID(const Value& value) { return static_cast<ReporterID>(value.toInt64()); }
 
-// The connection has checked the argument's type against the signature, so narrowing loses nothing.
+// Narrowing loses nothing, because the connection has checked the argument's type against the
+// signature.
 template <typename Enumeration>
 Enumeration enumeration(const Value& value) {
   return static_cast<Enumeration>(value.toUInt64());
@@ -168,14 +169,14 @@ void invokeKillService(ExportedObject& object, Invocation&& request) {
   service(object).killService(boolReply(std::move(request.reply)));
 }
 
-// Three time stamps and the tag.
+// The three time stamps and the tag.
 constexpr std::size_t kEntriesAddedToMessage = 4;
 
 constexpr MethodEffect kMore = MethodEffect::kMayHoldMore;
 constexpr MethodEffect kNoMore = MethodEffect::kHoldsNoMore;
 
-// The effects decide what a client over its limit may still ask for. Whatever lets it recover,
-// above all stops and destroys, holds no more.
+// The effects decide which requests a client over its limit may still make. The requests that let
+// it recover, above all stops and destroys, do not make the service hold more.
 constexpr std::array kMethods{
     InterfaceMethod{"createReportingSession", "x", "b", MethodEffect::kMakesSession, invokeCreate},
     InterfaceMethod{"setServiceType", "qx", "b", kNoMore, invokeSetServiceType},
@@ -188,7 +189,8 @@ constexpr std::array kMethods{
     InterfaceMethod{"destroyReportingSession", "x", "b", kNoMore, invokeDestroy},
     InterfaceMethod{"reporterIDValid", "x", "a{sv}", kNoMore, invokeReporterIDValid},
     InterfaceMethod{"getAllReporters", "", "ax", kNoMore, invokeGetAllReporters},
-    // Any user who can connect could otherwise end the service for all others.
+    // Only the owner may call it, because any user who can connect could otherwise end the service
+    // for all others.
     InterfaceMethod{"killService", "", "b", kNoMore, invokeKillService, nullptr,
                     MethodAccess::kOwner},
 };

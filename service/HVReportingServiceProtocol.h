@@ -54,7 +54,7 @@ class HVReportingServiceProtocol : public platform::ExportedObject {
                            AudioEventType type, ReporterIDs reporterIDs, ErrorReply reply,
                            RequestContext context) = 0;
   // Does the same for a request of a connection, whose arguments need no copy. Queues the work at
-  // endOfRequests(), or before another request: the messages of one read become one job.
+  // endOfRequests() or before another request. The messages of one read therefore become one job.
   virtual void postMessage(platform::Message message, AudioEventCategory category,
                            AudioEventType type, std::optional<platform::Array> reporterIDs,
                            platform::PostedRequest request, platform::ProcessID sender) = 0;

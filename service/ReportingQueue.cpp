@@ -21,7 +21,8 @@ const char* const gReportingQueueName = "com.tarno.halvox.reporting.server";
 std::shared_ptr<platform::DispatchQueue> reportingQueue() { return slot().copy(); }
 
 void createReportingQueue() {
-  // A thread of its own, because some requests wait: a stop can wait for a trace or a file.
+  // The queue has a thread of its own, because some requests wait: a stop can wait for a trace or a
+  // file.
   slot().set(platform::dispatch().createSerialQueue(gReportingQueueName,
                                                     platform::QualityOfService::kUserInteractive,
                                                     platform::QueueThreading::kOwnThread));

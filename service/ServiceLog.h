@@ -9,7 +9,8 @@
 
 namespace halvox {
 
-// The log of this folder's sources. All log under the delegate's name; tools match it.
+// The log of this folder's sources. All of them log under the name of the delegate's class, which
+// tools match.
 inline constexpr platform::UnitLog kServiceLog(&HVReportingServiceDelegateCategory,
                                                "HVReportingServiceDelegate");
 

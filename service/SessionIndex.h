@@ -10,8 +10,9 @@
 
 namespace halvox {
 
-// Finds sessions across all registered clients. Gives the answers of a walk over the clients in the
-// order of their registration, without the walk: every message needs them.
+// Finds sessions across all registered clients. Gives the same answers as a walk over the clients
+// in the order of their registration. Every message needs such an answer, and a walk would cost
+// more with every client.
 //
 // Owned by the delegate; reporting queue only. Holds its sessions: a client must report every
 // session that it drops. No operation fails.

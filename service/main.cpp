@@ -41,7 +41,7 @@ int serve(const Configuration& configuration) {
   platform::NSXPCListener& listener = platform::connections().serviceListener();
   listener.setDelegate(*delegate);
   listener.resume();
-  // A thread that did not end may still use the adapters, so nothing is destroyed.
+  // Nothing is destroyed, because a thread that did not end may still use the adapters.
   if (!adapters.close()) std::quick_exit(EXIT_SUCCESS);
   return EXIT_SUCCESS;
 }

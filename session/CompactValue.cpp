@@ -24,7 +24,7 @@ enum Tag : std::uint8_t {
   kFloat,
   kDouble,
   kDate,
-  // The same without its lowest bytes, which are zero for short fractions.
+  // A difference of bits without its lowest bytes, which are zero for short fractions.
   kFloatShiftedUp,
   kDoubleShiftedUp,
   kDateShiftedUp,
@@ -38,8 +38,8 @@ constexpr unsigned kTagBits = 4;
 constexpr unsigned kBitsOfByte = 8;
 constexpr unsigned kBytesOfBits = 8;
 constexpr std::uint64_t kByteMask = 0xFF;
-// The levels of containers within containers. A client's message has at most those that the wire
-// allows, which are far fewer.
+// The deepest nesting of containers that is read, because damaged bytes could otherwise exhaust the
+// stack. A client's message never comes near it: the wire allows far fewer levels.
 constexpr unsigned kMaxDepth = 256;
 constexpr unsigned kToShiftedUp = kFloatShiftedUp - kFloat;
 
@@ -68,8 +68,8 @@ std::uint64_t bitsBefore(const Value& previous) {
   return isOne ? std::bit_cast<std::uint64_t>(previous.toDouble()) : 0;
 }
 
-// Puts the sign into the lowest bit, so that small negative differences are short too. All
-// arithmetic wraps around: any two numbers have a difference.
+// Puts the sign into the lowest bit, because small negative differences are then short too. All
+// arithmetic wraps around, and therefore any two numbers have a difference.
 std::uint64_t zigzag(std::uint64_t difference) {
   const std::uint64_t sign = (difference >> 63U) != 0 ? ~std::uint64_t{0} : 0;
   return (difference << 1U) ^ sign;

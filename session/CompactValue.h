@@ -28,7 +28,7 @@ class CompactWriter {
  public:
   explicit CompactWriter(std::vector<std::byte>& bytes) : bytes_(bytes) {}
 
-  // Seven bits a byte, the lowest first, so that small numbers take one byte.
+  // Writes seven bits into each byte, the lowest bits first. A number below 128 takes one byte.
   void append(std::uint64_t number);
   void append(std::string_view text);
   void append(const platform::Value& previous, const platform::Value& value);
@@ -45,7 +45,7 @@ class CompactWriter {
 };
 
 // Reads what a CompactWriter wrote, in the same order. Bytes that no CompactWriter writes are
-// damage: from then on isIntact() is false, and everything that is read is zero or empty. The bytes
+// damage: after them isIntact() is false, and everything that is read is zero or empty. The bytes
 // must outlive the reader. Belongs to one thread.
 class CompactReader {
  public:
@@ -55,11 +55,11 @@ class CompactReader {
   [[nodiscard]] bool isAtEnd() const { return position_ == bytes_.size(); }
   [[nodiscard]] std::size_t position() const { return position_; }
   std::uint64_t number();
-  // The number of items that follow. Each takes at least a byte: a number larger than that of the
-  // remaining bytes is damage, for which 0 is returned. The caller may therefore reserve memory for
-  // the items.
+  // Reads the number of items that follow. Every item takes at least one byte. If the number is
+  // larger than the number of remaining bytes, the bytes are damaged and the result is 0. The
+  // caller may therefore reserve memory for the items.
   std::size_t count();
-  // The results of both are valid as long as the bytes.
+  // The results of bytes() and text() are valid as long as the bytes that this object reads.
   std::span<const std::byte> bytes(std::size_t length);
   std::string_view text();
   platform::Value value(const platform::Value& previous);

@@ -35,8 +35,8 @@ HVReportingSession::HVReportingSession(ReporterID reporterID, ProcessIdentifiers
   emitTracePoint(ReportingTracePoint::kSessionCreated);
 }
 
-// Does not stop the session: a started one that is replaced under its ID ends without a report.
-// This is required.
+// Does not stop the session. If a client replaces a started session by a new one with the same ID,
+// the old session ends without a report. This is required.
 HVReportingSession::~HVReportingSession() {
   emitTracePoint(ReportingTracePoint::kSessionDestroyed);
   kSessionLog.info("deallocing this session ", number(reporterID()));
@@ -67,8 +67,8 @@ void HVReportingSession::appendDescription(std::string& text) const {
 }
 
 // The history is new for every run: a message that repeats one of the previous run is recorded
-// again. The link's start is queued here, ahead of the run's messages, which wait there until the
-// discovery has ended.
+// again. The link's start job is queued here, before any message of the run. The messages then wait
+// in the link's queue until the discovery has ended.
 void HVReportingSession::start() {
   kSessionLog.debug("starting session owned by ", number(reporterID()));
   if (started()) {
@@ -88,17 +88,18 @@ void HVReportingSession::stop() {
   if (!started()) return;
   kSessionLog.debug("ending session ", number(reporterID()));
   emitTracePoint(ReportingTracePoint::kSessionStopped);
-  // This order is required. The volume messages become part of the history first: the file and
-  // the summary event contain them; the file does not contain the summary event.
+  // This order is required. The volume messages become part of the history first, because the file
+  // and the summary event contain them. The file does not contain the summary event.
   sendVolumeMessages();
   summary_.writeFile();
   sendSummaryEvent();
-  // After the messages above, so that they reach the link before its flush.
+  // Queued after the messages above, which must reach the link before its flush.
   if (tlmReportingEnabled()) link_.submitStop(shared_from_this());
   tracing_.stop();
-  // Destroyed at the end of this function, without the lock: a long history takes its time.
+  // The history is destroyed at the end of this function, without its lock, because destroying a
+  // long history takes long.
   const std::optional<MessageHistory> history = history_.end();
-  // Last: the messages of the stop above are those of a started session.
+  // Cleared last, because the messages that this stop sends count as messages of a started session.
   started_.store(false, std::memory_order_release);
 }
 
@@ -111,8 +112,8 @@ void HVReportingSession::sendVolumeMessages() {
   });
 }
 
-// Goes through the session only. Unlike a volume message it is not sent to the analytics service;
-// this is required.
+// Sends the summary event through the session only. Unlike a volume message, the event does not go
+// to the analytics service; this is required.
 void HVReportingSession::sendSummaryEvent() {
   const Message summary = summary_.createEvent();
   if (!summary.has_value()) return;
@@ -140,8 +141,9 @@ void HVReportingSession::sendMessage(const Message& message, AudioEventCategory 
   const SessionHistory::Outcome outcome = history_.record(category, type, tagged);
   count(outcome);
   emitTracePoint(ReportingTracePoint::kMessageSent);
-  // Read here and not in the link's job: by the time the job runs, the session may have been
-  // stopped or started again. Read after the message was recorded; this order is required.
+  // The state is read here and not in the link's job: by the time the job runs, the session may
+  // have been stopped or started again. It is read after the message was recorded; this order is
+  // required.
   const bool wasStarted = started();
   if (tlmReportingEnabled()) {
     LinkMessage linkMessage{.original = message,
@@ -151,12 +153,13 @@ void HVReportingSession::sendMessage(const Message& message, AudioEventCategory 
                             .wasStarted = wasStarted,
                             .isRedundant = outcome == SessionHistory::Outcome::kRedundant,
                             .sender = sender != nullptr ? sender : held_.account()};
-    // A sender who waits for the reply gets it before the link has done anything.
+    // A message with a reply is always queued: the sender gets its reply before the link does any
+    // work.
     if (reply || !link_.trySend(linkMessage)) {
       link_.submit(shared_from_this(), std::move(linkMessage));
     }
   }
-  // The sender does not wait for the link and never hears of its failures.
+  // The reply neither waits for the link nor reports the link's failures.
   if (reply) reply(std::nullopt);
 }
 

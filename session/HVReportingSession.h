@@ -71,7 +71,7 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   // returned dictionary.
   [[nodiscard]] platform::Dictionary configuration() const { return profile_.configuration(); }
   // Both add the entries of a dictionary. A new value replaces the old one, and no key is ever
-  // removed. None changes nothing.
+  // removed. Without a dictionary nothing changes.
   void setConfiguration(const platform::Message& configuration);
   void updateConfigurationWithContentsOfConfiguration(const platform::Dictionary& configuration) {
     profile_.mergeConfiguration(configuration);
@@ -137,8 +137,8 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   void writeSummaryJson() const { summary_.writeFile(); }
 
   // Records a message, unless it repeats the previous one of its category and type, and passes it
-  // to the link. `sync` has no effect; this is required. Calls the reply, if there is one, with
-  // none before it returns. While the message waits for the link it is charged to `sender`, the
+  // to the link. `sync` has no effect; this is required. Calls the reply, if there is one, without
+  // an error before it returns. While the message waits for the link it is charged to `sender`, the
   // client that sent it, which need not own the session; null charges the session's account.
   void sendMessage(const platform::Message& message, AudioEventCategory category,
                    AudioEventType type, bool sync, const ErrorReply& reply,
@@ -146,8 +146,8 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   void sendMessage(const platform::Message& message, AudioEventCategory category,
                    AudioEventType type, const ErrorReply& reply, const Account& sender = nullptr);
   // Sends one message outside any session, one second from now, on the background queue, and then
-  // calls the reply there, if there is one. `userInfo` has no effect; this is required. Until then
-  // the message is charged to `sender`; null charges nobody.
+  // calls the reply, if there is one, on that queue. `userInfo` has no effect; this is required.
+  // Until it is sent, the message is charged to `sender`; null charges nobody.
   static void sendSingleMessage(const platform::Message& message, AudioEventCategory category,
                                 AudioEventType type, AudioServiceType serviceType,
                                 const platform::Dictionary& userInfo, const ErrorReply& reply,
@@ -156,8 +156,8 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   // The message history of the current run, locked. The lock also guards the counts of identifiers.
   [[nodiscard]] HistoryLock nestedAggregatedPayloadData() const { return history_.lock(); }
   // Records a message under its next identifier and returns false, or drops it as redundant and
-  // returns true. The caller holds the history; if that is none, nothing is recorded and the result
-  // is false.
+  // returns true. The caller holds the history's lock. Without a history nothing is recorded and
+  // the result is false.
   bool createMessageIdentifierWithCategory(const HistoryLock& history, AudioEventCategory category,
                                            AudioEventType type,
                                            const platform::Dictionary& message) {
@@ -181,8 +181,8 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   Guarded<BoolReply> transactionCompleteBlock_;
   Guarded<std::optional<DriverSnapShot>> driverSnapShot_;
   std::atomic<bool> tlmReportingEnabled_{false};  // orders nothing else
-  // Set before the history exists and cleared after it has been taken. A thread that sees it set
-  // may still find no history, and then records nothing.
+  // Set before the history is created and cleared after it has been taken. A thread that reads true
+  // may therefore find no history, and then records nothing.
   std::atomic<bool> started_{false};
 };
 

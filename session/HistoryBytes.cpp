@@ -8,7 +8,7 @@ namespace {
 // Large enough that moving a piece out costs little more than copying its bytes, and small compared
 // with what one session may hold.
 constexpr std::size_t kPieceBytes = 64 * 1024;
-// An entry of a message seldom takes more. A piece that has less room left is full.
+// A piece with less room than this is full. Few entries take more.
 constexpr std::size_t kRoomForEntry = 512;
 
 }  // namespace
@@ -26,8 +26,8 @@ std::vector<std::byte>& HistoryBytes::last() {
   return pieces_.back().bytes;
 }
 
-// A vector that grows doubles its capacity. A piece of 64 KiB therefore wastes little; only one
-// with an entry of many KiB at its end needs to be trimmed.
+// Trims the full piece if its capacity exceeds kPieceBytes, because a growing vector doubles its
+// capacity. A smaller waste is not worth a copy.
 void HistoryBytes::startPiece() {
   if (!pieces_.empty() && !pieces_.back().place.has_value()) {
     std::vector<std::byte>& full = pieces_.back().bytes;

@@ -14,8 +14,8 @@ namespace halvox {
 // The bytes of a history: pieces in order, the last of which grows. Full pieces can be moved out of
 // memory.
 //
-// Owned by a MessageHistory, whose lock guards it. Gives the room of moved pieces back when it is
-// destroyed.
+// Owned by a MessageHistory, whose lock guards it. The destructor releases the storage of the
+// pieces that were moved out.
 class HistoryBytes {
  public:
   HistoryBytes() = default;
@@ -42,10 +42,10 @@ class HistoryBytes {
   // Reads a piece that was moved out.
   [[nodiscard]] std::optional<platform::Error> read(std::size_t piece,
                                                     std::vector<std::byte>& bytes) const;
-  // True if the piece cannot get another entry.
+  // True if no more entries are appended to the piece.
   [[nodiscard]] bool isFull(std::size_t piece) const { return piece + 1 < pieces_.size(); }
 
-  // Bytes in memory, room for further entries included.
+  // Bytes in memory, including the room that is reserved for further entries.
   [[nodiscard]] std::size_t memorySize() const {
     return movableSize() + pieces_.size() * sizeof(Piece);
   }

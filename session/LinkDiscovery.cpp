@@ -15,8 +15,8 @@ constexpr std::string_view kQueueLabel = "com.tarno.halvox.session.discovery";
 
 void LinkDiscovery::awaitAnswer() {
   if (!isSecondCall()) return;
-  // A queue only for the rare answer that comes before the wait. Its job logs and signals, and
-  // cannot block.
+  // The queue is made only here, because an answer seldom comes before the wait. Its job logs and
+  // signals, and cannot block.
   platform::dispatch()
       .createSerialQueue(kQueueLabel, platform::QualityOfService::kUtility,
                          platform::QueueThreading::kShared)

@@ -11,8 +11,8 @@ namespace halvox {
 
 // Passes the framework's answer about back-ends to one start of a session's link, and keeps the log
 // of the link in order: the answer is reported only after the start job has logged that it waits.
-// The framework may answer before that. Then the answer stays here and is reported from a queue of
-// its own, because the link's queue is about to wait for the report.
+// If the framework answers earlier, this object keeps the answer and reports it from a queue of its
+// own, because the link's queue is about to wait for the report.
 //
 //   new --awaitAnswer()--> waiting  --answer()-->      reported on the framework's thread
 //   new --answer()-->      answered --awaitAnswer()--> reported by a job of its own queue
@@ -35,7 +35,7 @@ class LinkDiscovery {
   void answer(const Backends& backends);
 
  private:
-  // True for the second of awaitAnswer() and answer().
+  // False in the first call of awaitAnswer() or answer(), true in the second one.
   bool isSecondCall() { return wasCalled_.exchange(true, std::memory_order_acq_rel); }
 
   const Report report_;

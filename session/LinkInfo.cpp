@@ -29,8 +29,8 @@ Dictionary LinkStart::userInfo() const {
   Dictionary info{
       {platform::kTLMReportingUserInfoClientName, kLinkClientName},
       {platform::kTLMReportingUserInfoServiceName, std::string(serviceName) + "_session"}};
-  // Last, because an entry of the configuration replaces the service's own of the same key. This is
-  // required.
+  // Added last: an entry of the configuration replaces the service's own entry of the same key.
+  // This is required.
   info.merge(configuration);
   return info;
 }

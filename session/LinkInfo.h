@@ -11,11 +11,11 @@ namespace halvox {
 // How the service identifies itself to the real-time framework, in every session info.
 inline constexpr int kLinkClientType = 19;
 inline constexpr double kHVReportingVersionNumber = 2.1;
-// The same in every user info.
+// How the service identifies itself in every user info.
 inline constexpr std::string_view kLinkClientName = "com.tarno.halvox";
 
-// The state of a session at the moment of its start, for the framework. Changes before the link's
-// start job runs do not count.
+// The state of a session at the moment of its start, for the framework. The link's start job runs
+// later and ignores the changes that were made meanwhile.
 struct LinkStart {
   AudioServiceType serviceType;
   std::string_view serviceName;  // a constant of the vocabulary
@@ -25,7 +25,8 @@ struct LinkStart {
   // if the configuration names one.
   [[nodiscard]] platform::Dictionary sessionInfo(
       ReporterID reporterID, const platform::TLMSecureHierarchyToken& token) const;
-  // Includes the whole configuration, whose entries replace the service's own of the same key.
+  // Includes the whole configuration, whose entries replace the service's own entries of the same
+  // key.
   [[nodiscard]] platform::Dictionary userInfo() const;
 };
 

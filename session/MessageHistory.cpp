@@ -15,15 +15,15 @@ using platform::Value;
 // Bounds the table of codes, because a client can invent any number of categories and types. A base
 // whose code is not in the table is found by its text. No honest client needs so many codes.
 constexpr std::size_t kMaxBasesByCode = 4096;
-// Bounds the number of forms. Each costs the memory of its last message, and the time of comparing
-// its keys with those of a message. At the bound, a message with other keys gets no form and is
-// written with its keys.
+// Bounds the number of forms. Each form costs the memory of its last message, and the time of
+// comparing its keys with those of a new message. At the bound, a message whose keys match no form
+// gets none and is written with its keys.
 constexpr std::size_t kMaxForms = 256;
 constexpr std::size_t kMaxFormsOfBase = 8;
 // Estimated bytes of a node and a bucket of a hash table.
 constexpr std::size_t kTableEntryOverhead = 48;
 
-// The number that each entry of the bytes begins with; forms follow.
+// Each entry begins with one of these numbers. The number of form n is kFirstForm + n.
 constexpr std::uint64_t kLoss = 0;
 constexpr std::uint64_t kSingle = 1;
 constexpr std::uint64_t kFirstForm = 2;
@@ -69,7 +69,7 @@ bool haveSameKeys(const Dictionary& left, const Dictionary& right) {
                     });
 }
 
-// How many bytes a bit for each of the keys takes.
+// The size in bytes of a mask with one bit for each key.
 std::size_t maskSizeFor(std::size_t keys) { return (keys + kBitsOfByte - 1) / kBitsOfByte; }
 
 // The keys of a message without their values.
@@ -169,7 +169,7 @@ std::optional<std::uint32_t> MessageHistory::formOf(Base& base, const Dictionary
   const auto found = std::ranges::find_if(base.forms_, hasItsKeys);
   if (found == base.forms_.begin() && found != base.forms_.end()) return *found;
   if (found != base.forms_.end()) {
-    // In front, where the next message finds it first.
+    // Moved to the front, where the next message finds it first.
     std::rotate(base.forms_.begin(), found, found + 1);
     return base.forms_.front();
   }
@@ -181,7 +181,8 @@ std::optional<std::uint32_t> MessageHistory::formOf(Base& base, const Dictionary
   return number;
 }
 
-// A bit for each key, set if its value differs from the previous one, then the values that differ.
+// Writes a mask with one bit for each key, set if its value differs from the previous one, and then
+// the values that differ.
 void MessageHistory::writeForm(std::uint32_t number, Dictionary message) {
   std::vector<std::byte>& bytes = bytes_.last();
   CompactWriter writer(bytes);
@@ -196,7 +197,8 @@ void MessageHistory::writeForm(std::uint32_t number, Dictionary message) {
     if (isRepetition(previous->value, value)) continue;
     bytes[bits + position / kBitsOfByte] |= std::byte{1} << (position % kBitsOfByte);
     writer.append(previous->value, value);
-    // Adding up the memory of all entries for each message cost more than comparing them.
+    // Only the change is added: adding up the memory of all entries for each message cost more than
+    // comparing them.
     memorySize_ += value.memorySize() - previous->value.memorySize();
   }
   form.previous = std::move(message);
@@ -300,8 +302,8 @@ bool equalApartFromVolatileKeys(const Dictionary& left, const Dictionary& right)
     const Dictionary::Entry* other = right.begin();
     const Dictionary::Entry* entry = left.begin();
     while (entry != left.end() && entry->key == other->key) {
-      // Values first: a benchmark showed that looking up the volatile keys for every entry cost
-      // most of a comparison.
+      // Values are compared first: a benchmark showed that testing every entry for a volatile key
+      // cost most of a comparison.
       if (!(entry->value == other->value) && !isVolatile(*entry)) return false;
       ++entry;
       ++other;

@@ -67,7 +67,7 @@ class MessageHistory {
     const platform::Dictionary* message_ = nullptr;  // owned by the reader
   };
 
-  // Reads the messages of a history from the first one on, including those that are added during
+  // Reads the messages of a history from the first one on, including messages that are added during
   // the reading. The history must stay where it is. Belongs to one thread, which holds the
   // history's lock during each call.
   class Reader {

@@ -27,7 +27,7 @@ constexpr auto kState = AudioEventType::kState;
 constexpr std::size_t kMiB = 1024 * 1024;
 constexpr std::size_t kTextBytes = 1000;
 
-// A message that nothing makes shorter.
+// A message that is stored in full, because its text differs from that of the message before.
 Dictionary messageOf(int number) {
   std::string text = std::to_string(number) + " ";
   text.resize(kTextBytes, 'x');
@@ -199,7 +199,8 @@ TEST_F(MessageHistoryOverflowTest, AHistoryWhoseBytesAreDamagedEndsBeforeTheDama
               HasSubstr("piece 0 of the history is damaged from byte 4 on"));
 }
 
-// What a base's newest message is does not depend on how it was kept.
+// The newest message of a base is the same whether it was kept in a form, with its keys, or not at
+// all.
 TEST_F(MessageHistoryOverflowTest, TheNewestMessageIsKnownHoweverItWasKept) {
   MessageHistory history;
   MessageHistory::Base& base = history.base(kPlayback, kState);

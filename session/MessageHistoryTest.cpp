@@ -104,7 +104,7 @@ TEST_F(MessageHistoryTest, CodesBeyondTheBoundStillFindTheirBase) {
     append(AudioEventCategory{0x0001'0000U * (code + 1) + 4}, kStart, {{"a", code}});
   }
 
-  // Four of them are domains with a text. All others share one base.
+  // Four of the codes have a domain with a text. All others share one base.
   EXPECT_EQ(history_.count("_Playback_Start"), kManyCodes - 4);
   EXPECT_EQ(history_.count("Session_Playback_Start"), 1U);
 }

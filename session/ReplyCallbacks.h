@@ -7,8 +7,8 @@
 
 namespace halvox {
 
-// The callbacks that answer requests. The error comes first; none means success. A callback may be
-// empty only where an operation says so: nobody wants the answer then.
+// The callbacks that answer requests. The first argument is the error; none means success. A
+// callback may be empty only where an operation says so; then no answer is wanted.
 using ErrorReply = std::function<void(const std::optional<platform::Error>& error)>;
 using BoolReply = std::function<void(const std::optional<platform::Error>& error, bool value)>;
 

@@ -29,7 +29,7 @@ class ResourceAccount {
   }
 
  private:
-  // Order nothing else: a reader that sees an old value admits one request too many.
+  // They order nothing else: a reader that sees an old value only admits one request too many.
   std::atomic<std::uint64_t> bytes_{0};
   std::atomic<std::uint64_t> sessions_{0};
 };
@@ -61,8 +61,8 @@ class ResourceCharge {
   std::size_t bytes_ = 0;
 };
 
-// Charges to an account what one session holds, as the amount changes. The destructor gives back
-// what is still charged. Without an account it charges nobody.
+// Charges to an account what one session holds, and follows every change of the amount. The
+// destructor removes from the account what is still charged. Without an account it charges nobody.
 //
 // Owned by the session, whose parts report their changes to it from any thread.
 class ResourceTally {
@@ -78,12 +78,12 @@ class ResourceTally {
   void chargeTo(std::shared_ptr<ResourceAccount> account) { account_ = std::move(account); }
   // The account, or null.
   [[nodiscard]] const std::shared_ptr<ResourceAccount>& account() const { return account_; }
-  // Something that took `before` bytes takes `after` bytes now.
+  // Call when something that the session holds has changed its size from `before` to `after` bytes.
   void change(std::size_t before, std::size_t after) {
     if (account_ == nullptr) return;
     // Unsigned: if less is held now, the difference wraps and adding it subtracts.
     const std::size_t difference = after - before;
-    // The usual case: most messages fit into memory that a history already has.
+    // The usual case: most messages fit into memory that the history has already reserved.
     if (difference == 0) return;
     account_->addBytes(difference);
     bytes_.fetch_add(difference, std::memory_order_relaxed);

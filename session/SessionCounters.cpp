@@ -5,7 +5,7 @@
 namespace halvox {
 namespace {
 
-// Looks up counters of one piece.
+// Looks up the counters of one piece of the service.
 class Piece {
  public:
   Piece(platform::StatisticsService& statistics, std::string_view name)

@@ -38,7 +38,7 @@ struct SessionCounters {
     platform::Counter& testSession;
     platform::Counter& noBackend;
   };
-  // received = sent + failed + sampled + the messages that still wait for their second.
+  // received = sent + failed + sampled + the messages whose delay of one second has not passed.
   struct SingleMessages {
     platform::Counter& received;
     platform::Counter& sent;

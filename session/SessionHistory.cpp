@@ -25,7 +25,7 @@ void SessionHistory::begin() { history_.set(MessageHistory()); }
 
 std::optional<MessageHistory> SessionHistory::end() {
   std::optional<MessageHistory> history = history_.take();
-  // The charge ends here: the history itself does not know the account.
+  // The charge is removed here, because the history itself does not know the account.
   held_.change(history.has_value() ? history->memorySize() : 0, 0);
   return history;
 }
@@ -58,13 +58,14 @@ SessionHistory::Outcome SessionHistory::recordLocked(const Lock& history,
     messages.lose(base, message);
     outcome = Outcome::kNoRoom;
   }
-  // Also if nothing was recorded: the table of codes may have grown.
+  // Called even if nothing was recorded, because the table of codes may have grown.
   held_.change(before, messages.memorySize());
   return outcome;
 }
 
-// When a history takes much memory, it goes on in a file. Only a full disk makes it lose a message.
-// A loss is logged once in a run, because a full disk stays full for many messages.
+// When a history takes much memory, it goes on in a file. It loses a message only if writing the
+// file fails, for instance because the disk is full. The first loss of a run is logged and the
+// others are not, because a full disk stays full for many messages.
 bool SessionHistory::makeRoom(MessageHistory& messages) const {
   const std::size_t movable = messages.movableSize();
   if (movable < kLeastToMove) return true;

@@ -25,7 +25,8 @@ class SessionHistory {
   // The history, locked. Holds none outside a run.
   using Lock = Guarded<std::optional<MessageHistory>>::Lock;
 
-  // What became of a message. kNoRoom: it was lost, but otherwise treated as a recorded one.
+  // What became of a message. kNoRoom: the message was not kept, but counted and compared with the
+  // next one like a recorded message.
   enum class Outcome : std::uint8_t { kRecorded, kRedundant, kNotStarted, kNoRoom };
 
   // Charges the history to `held`, which must outlive this.
@@ -47,7 +48,7 @@ class SessionHistory {
                  const platform::Dictionary& message) {
     return recordLocked(lock(), category, type, message);
   }
-  // The same for a caller that holds the lock.
+  // Does the same for a caller that holds the lock.
   Outcome recordLocked(const Lock& history, AudioEventCategory category, AudioEventType type,
                        const platform::Dictionary& message);
 

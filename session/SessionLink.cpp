@@ -21,7 +21,7 @@ using platform::JobWeight;
 using platform::WaitOutcome;
 
 constexpr std::string_view kQueueLabel = "com.tarno.halvox.session.tlmreporting";
-// How long messages are held back at most while no back-end has been found. The value is required.
+// The longest time for which messages wait while no back-end has been found. The value is required.
 constexpr std::chrono::seconds kBackendTimeOut{9};
 // Estimated bytes of a waiting job and its place in the queue, in addition to its content.
 constexpr std::size_t kWaitingOverhead = 256;
@@ -89,8 +89,8 @@ void SessionLink::start(const Owner& owner, const LinkStart& atStart) {
   const auto opened = framework.TLMReportingCreateSession(
       atStart.sessionInfo(profile_.reporterID(), *token), atStart.userInfo());
   tlmReportingSession_.set(opened);
-  // Weak: the framework may never answer. If the session no longer exists then, the answer is only
-  // logged.
+  // The callback holds the link weakly, because the framework may never answer. If the session no
+  // longer exists when the answer comes, the answer is only logged.
   const auto discovery = std::make_shared<LinkDiscovery>(
       [weakLink = std::weak_ptr(heldBy(owner))](const LinkDiscovery::Backends& backends) {
         logBackends(backends);
@@ -105,13 +105,13 @@ void SessionLink::start(const Owner& owner, const LinkStart& atStart) {
 }
 
 void SessionLink::onBackendsFound(bool found) {
-  // The flag first: the job that the signal releases reads it.
+  // The flag is set before the signal, because the job that the signal releases reads the flag.
   tlmReportingSessionStarted_.store(found, std::memory_order_release);
   tlmreportingBackendSemaphore()->signal();
 }
 
-// An answer after the time-out leaves its signal in the semaphore and may leave the flag set. Both
-// are kept, and this is required: the signal ends the wait of the next start at once.
+// An answer after the time-out leaves its signal in the semaphore and may leave the flag set.
+// Neither is reset, and this is required: the signal ends the wait of the next start at once.
 void SessionLink::endStart(WaitOutcome outcome) {
   if (outcome == WaitOutcome::kTimedOut) {
     kLinkLog.notice("timed out waiting for backends");
@@ -137,16 +137,16 @@ void SessionLink::submitStop(const Owner& owner) {
 
 void SessionLink::stop(const Owner& owner) {
   kLinkLog.debug("entering tlmreporting -[HVReportingSession stop]_block_invoke");
-  // Tests the type of this moment, unlike the start. A session that became a test meanwhile is
-  // neither flushed nor closed; this is required.
+  // Tests the current type, while the start tested the type at the moment of the start. A session
+  // that became a test meanwhile is neither flushed nor closed; this is required.
   if (!mayUseFramework(profile_.serviceType())) return;
   const auto open = tlmReportingSession();
   if (open == nullptr) {
     endStop();
     return;
   }
-  // A semaphore of its own, because the link's semaphore counts discoveries. The wait has no
-  // time-out: the framework promises to end every flush.
+  // The flush has a semaphore of its own, because the link's semaphore counts discoveries. The wait
+  // has no time-out, because the framework promises to end every flush.
   const auto flushed = platform::dispatch().createSemaphore(0);
   platform::tlmReporting().TLMReportingFlushMessages(open, [flushed] { flushed->signal(); });
   tlmReportingQueue()->waitOn(flushed, std::nullopt,
@@ -171,7 +171,7 @@ void SessionLink::submit(const Owner& owner, LinkMessage message) {
 }
 
 bool SessionLink::trySend(const LinkMessage& message) {
-  // Single messages are delayed anyway.
+  // A single message gains nothing here, because it waits one second anyway.
   if (!message.wasStarted || !platform::tlmReporting().onlyNotesMessages()) return false;
   const platform::QueueEntry entry(*tlmReportingQueue());
   if (!entry) return false;
@@ -205,8 +205,8 @@ void SessionLink::sendThroughFramework(const LinkMessage& message) {
       open, {.category = category, .type = number(message.type), .payload = message.tagged});
   if (outcome.sent) {
     counters_.link.sent.add();
-    // The line shows the message without its tag and the category with its domain. The framework
-    // got the tag but not the domain. All of this is required.
+    // The line shows the message without its tag and the category with its domain, although the
+    // framework got the tag but not the domain. All of this is required.
     kSessionLog.debug("TLMReportingAgent ", *open, " : message ", message.original, " : category ",
                       number(message.category), " : type ", number(message.type));
     return;
@@ -218,7 +218,7 @@ void SessionLink::sendThroughFramework(const LinkMessage& message) {
   }
 }
 
-// Uses the service type of this moment, not the one of the moment of sending; this is required.
+// Uses the current service type, not the type at the moment of sending; this is required.
 void SessionLink::sendAsSingleMessage(const LinkMessage& message) const {
   kSessionLog.debug("session not started, will send as a single message");
   counters_.link.single.add();

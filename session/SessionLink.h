@@ -62,10 +62,11 @@ class SessionLink {
   void submitStart(const Owner& owner);
   // Sends a message through the link, or as a single message if it was sent outside a run.
   void submit(const Owner& owner, LinkMessage message);
-  // Does the same at once, on the calling thread, if nothing waits in the queue and the framework
-  // only notes messages. Otherwise returns false; the caller then calls submit(). The order of
-  // messages stays the same. As a job of the pool, a message takes 1,865 instructions instead of
-  // 450 even without a link. When messages are rare, it also takes another change of threads.
+  // Sends the message like submit(), but at once and on the calling thread, if nothing waits in the
+  // queue and the framework only notes messages. Otherwise does nothing and returns false; the
+  // caller then calls submit(). The order of messages stays the same. As a job of the pool, a
+  // message takes 1,865 instructions instead of 450 even without a link. When messages are rare,
+  // the job also costs another change of threads.
   [[nodiscard]] bool trySend(const LinkMessage& message);
   // Flushes what the framework still holds and closes the link.
   void submitStop(const Owner& owner);
@@ -86,7 +87,7 @@ class SessionLink {
   [[nodiscard]] bool tlmReportingSessionStarted() const {
     return tlmReportingSessionStarted_.load(std::memory_order_acquire);
   }
-  // The flag itself, for callers that watch it; lives as long as the link. Only tests do.
+  // The flag itself, which lives as long as the link. Only tests watch it.
   [[nodiscard]] const std::atomic<bool>* getTLMReportingStartedState() const {
     return &tlmReportingSessionStarted_;
   }
@@ -110,7 +111,8 @@ class SessionLink {
   const SessionProfile& profile_;    // the session's
   const ResourceTally& held_;        // the session's
   const SessionCounters& counters_;  // held by the session
-  // Next to each other because each takes half a word: a service may have 10,000 sessions.
+  // These two are adjacent because each takes half a word and would otherwise be padded to a whole
+  // one: a service may have 10,000 sessions.
   std::once_flag queueMade_;
   std::once_flag backendSemaphoreMade_;
   std::shared_ptr<platform::DispatchQueue> queue_;

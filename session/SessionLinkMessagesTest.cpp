@@ -37,7 +37,7 @@ TEST_F(SessionLinkMessagesTest, MessagesThatWaitedAreSentInOrder) {
                                       Dictionary{{"a", 3}, {"audiotag", "PlaybackStart"}}));
 }
 
-// A framework that only notes messages, and queues that threads may enter: those of the service in
+// A framework that only notes messages, and queues that threads may enter. The service has both in
 // its default configuration.
 class SessionLinkAtOnceTest : public LinkFixture {
  protected:
@@ -208,8 +208,8 @@ TEST_F(SessionLinkMessagesTest, ASessionThatBecameATestSendsNoMore) {
   EXPECT_THAT(framework_.messages(), IsEmpty());
 }
 
-// The counters give the reason why a message was not sent; of several reasons, the first in this
-// order.
+// The counters give the reason why a message was not sent. If there are several reasons, the first
+// one in this order is counted.
 TEST_F(SessionLinkMessagesTest, ARepeatCountsAsOneThoughTheLinkIsDown) {
   start();  // finds no server
 

@@ -241,7 +241,8 @@ TEST_F(SessionLinkTest, ASignalThatCameTooLateFailsTheNextStartAtOnce) {
   EXPECT_THAT(linkLines(), ElementsAre(kStartEntered, kWaiting, kFailed));
   EXPECT_TRUE(holdsNothing());
 
-  // Nobody waits for the second callback either: its signal remains for the third start.
+  // The second start no longer waits when the framework answers. The signal of this answer ends the
+  // wait of the third start.
   framework_.answerDiscovery(kServers);
   stop();
   linkLines();

@@ -7,7 +7,8 @@
 
 namespace halvox {
 
-// The log of this folder's sources. All log under the session's name; tools match it.
+// The log of this folder's sources. All of them log under the name of the session's class, which
+// tools match.
 inline constexpr platform::UnitLog kSessionLog(&HVReportingSessionCategory, "HVReportingSession");
 
 // Values of the vocabulary as log lines show them.

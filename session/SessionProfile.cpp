@@ -25,8 +25,9 @@ void SessionProfile::setServiceType(AudioServiceType serviceType) {
   kSessionLog.info("setting service type ", serviceName());
 }
 
-// Looked up on every call instead of stored: no reader can see a type with the name of another. A
-// new session needs no special case, since its type is kUnknown and its name is "unknown".
+// The name is looked up on every call instead of stored. A reader therefore never sees a type with
+// the name of another. A new session needs no special case: its type is kUnknown and its name is
+// "unknown".
 std::string_view SessionProfile::serviceName() const {
   return HVReportingUtilityGenerateServiceNameFromServiceType(serviceType());
 }

@@ -19,10 +19,11 @@ namespace {
 
 using platform::Message;
 
-// Fixed by the interface; the platform puts its storage root in front of it.
+// The interface fixes this path. The platform puts its storage root in front of it.
 constexpr std::string_view kDirectory =
     "/private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Reporting";
-// The readers of these files expect it. The storage root's own permissions keep others out.
+// The readers of these files expect these permissions. Other users are kept out by the permissions
+// of the storage root.
 constexpr std::uint32_t kDirectoryPermissions = 0777;
 
 }  // namespace
@@ -60,14 +61,15 @@ Message SessionSummary::createEvent() const {
 void SessionSummary::writeFile() const {
   if (!HVReportingUtilityIsInternalBuild() || history_.size() == 0) return;
   platform::FileService& files = platform::files();
-  // Not fatal: the file is tried anyway, and its failure is logged as well. Both lines are
-  // required.
+  // Creating the file is tried even if this fails, and the failure of the file is logged as well.
+  // Both lines are required.
   if (const auto error = files.createDirectory(kDirectory, kDirectoryPermissions)) {
     kSessionLog.error("can't create logging directory at ", kDirectory, ": ", error->description);
   }
   const auto file = files.createJsonArrayFile(kDirectory, fileName());
   {
-    // Held until all of it has been written: the file shows one moment of the history.
+    // The lock is held until the whole history has been written, because the file shows one moment
+    // of the history.
     const SessionHistory::Lock history = history_.lock();
     if (!history->has_value()) return;
     MessageHistory::Reader reader(**history);

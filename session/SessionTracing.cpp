@@ -31,8 +31,9 @@ bool isTracingOn() {
 }
 
 // True if the configuration chooses the runner. Compares the identity of the text, not its
-// spelling, and this is required: any other text that spells "ktrace" chooses the framework, and so
-// does a missing one. A client's text works because the decoder turns "ktrace" into the constant.
+// spelling, and this is required: any other text that spells "ktrace" chooses the framework, and a
+// missing entry does too. A client's text works because the decoder turns "ktrace" into the
+// constant.
 bool choosesRunner(const platform::Dictionary& configuration) {
   const platform::Value* type = configuration.find(HVReportingTraceType);
   return type != nullptr && type->isIdenticalTo(HVReportingTraceTypeKtrace);
@@ -78,9 +79,10 @@ void SessionTracing::start(const Owner& owner) {
   }
 }
 
-// The runner that was just set up. If its path was empty, the parameters of an earlier run are
-// traced again. That takes a new runner, because a runner records once and its results must be
-// those of this run alone. Null if no parameters were ever set up.
+// Returns the runner that setupTracing() has just made. If the path was empty, setupTracing() made
+// none, and the parameters of an earlier run are traced again. They need a new runner, because a
+// runner records once and its results must be those of this run alone. Null if no parameters were
+// ever set up.
 std::shared_ptr<TraceRunner> SessionTracing::runnerForThisRun() {
   auto current = traceRunner();
   if (current == nullptr || current->canRun()) return current;
@@ -102,7 +104,8 @@ void SessionTracing::setupTracing(const std::string& path) {
     state->params = std::move(params);
     state->runner.swap(runner);  // destroys the former runner after the lock
   }
-  // Required here: the start marks the session as traced only when a runner exists.
+  // The mark is cleared here, and this is required: the start marks the session as traced only when
+  // a runner exists.
   setStartedTracing(false);
   kSessionLog.info("Setting up tracing for ", profile_.serviceName());
 }
@@ -117,9 +120,9 @@ void SessionTracing::startFrameworkTrace(const Owner& owner) {
     state->config = std::move(config);
     state->session.swap(former);
   }
-  // The former trace still records if its stop chose the runner. It ends when this function
-  // releases it. Its delegate is removed first, so that its callbacks are not taken for those of
-  // the new one.
+  // If the stop of the former trace chose the runner, the former trace still records. It ends when
+  // this function releases it. Its delegate is removed first, because its callbacks would otherwise
+  // be taken for those of the new trace.
   if (former != nullptr) former->setDelegate({});
   trace->setDelegate(std::shared_ptr<SessionTracing>(owner, this));
   setStartedTracing(true);
@@ -138,8 +141,8 @@ void SessionTracing::stop() {
     return;
   }
   if (const auto trace = traceSession()) trace->stopKQTrace();
-  // Waits until the trace has completed, however long that takes. A trace whose start failed never
-  // completes, and then this never returns. That there is no time-out is required.
+  // Waits until the trace has completed. There is no time-out, and this is required. If the trace
+  // failed to start, it never completes, and this function never returns.
   mTraceDispatchSemaphore_->wait();
 }
 

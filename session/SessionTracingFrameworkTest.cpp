@@ -96,8 +96,9 @@ TEST_F(SessionTracingFrameworkTest, FailedStopClearsTheTrace) {
   EXPECT_EQ(lines(LogLevel::kError, "hvrt"), Texts{"kqTraceDidStop disk"});
 }
 
-// The end of a trace is the last thing that a stop waits for. From there on this thread holds the
-// history: the stop cannot take it, and the session must stay marked as started.
+// The end of the trace is the last event that a stop waits for before it takes the history. This
+// test then holds the history's lock: the stop cannot take the history, and the session must stay
+// marked as started.
 TEST_F(SessionTracingFrameworkTest, StopClearsTheFlagAfterTheHistory) {
   constexpr int kRounds = 10;
   constexpr int kYields = 50;
@@ -202,7 +203,8 @@ TEST_F(SessionTracingFrameworkTest, StopOfTheFrameworkWhileTheRunnerRecordsWaits
   letRun();
   chooseFramework();
 
-  // The framework has no trace. None completes, and the wait never ends. This is required.
+  // The framework has no trace. Therefore none completes, and the wait never ends. This is
+  // required.
   EXPECT_THROW(session_->stop(), std::logic_error);
 
   EXPECT_TRUE(session_->started());

@@ -47,8 +47,8 @@ std::optional<platform::Error> handOver(const SingleMessage& single,
       {platform::kTLMReportingUserInfoClientName, kLinkClientName},
       {platform::kTLMReportingUserInfoServiceName,
        HVReportingUtilityGenerateServiceNameFromServiceType(single.serviceType)}};
-  // The message of a session was cleaned before. One that no session took comes here as the client
-  // sent it.
+  // A message that a session took has already been cleaned. A message that no session took arrives
+  // here as the client sent it.
   const Dictionary payload =
       HVReportingUtilityRemoveWhiteSpaceFromKeys(single.message.value_or(Dictionary()));
   platform::TLMReportingOutcome outcome = platform::tlmReporting().TLMReportingSendOneMessage(

@@ -22,7 +22,8 @@ const Key kVolumeBucketedKey("RQSessionVolumeBucketed");
 const Key kPlaySecondsKey("play_seconds");
 const Key kPlaySecondsBucketedKey("play_secondsBucketed");
 
-// Four digits show every sixteenth exactly; the seconds are whole numbers.
+// Four digits show every bucket of volumes, a multiple of one sixteenth, exactly. The buckets of
+// seconds are whole numbers.
 constexpr int kVolumeFractionDigits = 4;
 constexpr int kSecondsFractionDigits = 0;
 
@@ -61,8 +62,9 @@ bool saysPlaying(const Dictionary& message) {
 }  // namespace
 
 std::optional<Dictionary> VolumeIntervals::add(const Dictionary& message) {
-  // Kept even by messages without a volume, and before the test below: the message that ends an
-  // interval gives it its own format, devices and process. This is required.
+  // These values are kept from every message, even one without a volume, and before the test below:
+  // the message that ends an interval gives the interval its format, devices and process. This is
+  // required.
   keepIfPresent(message, kFormatKey, format_);
   keepIfPresent(message, kDevicesKey, devices_);
   keepIfPresent(message, kProcessKey, process_);
@@ -84,8 +86,8 @@ std::optional<Dictionary> VolumeIntervals::add(const Dictionary& message) {
 }
 
 Dictionary VolumeIntervals::makeMessage(double seconds) const {
-  // Has the volume that was playing, not the one that ended the interval. The length is stored in
-  // single precision, but its bucket is chosen by the double. Both are required.
+  // The message has the volume that was playing, not the one that ended the interval. The length is
+  // stored in single precision, but its bucket is chosen in double precision. Both are required.
   return {{kFormatKey, format_},
           {kDevicesKey, devices_},
           {kProcessKey, process_},
