@@ -7,7 +7,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Removes the part up to the separator from the front of `text`, and returns it.
+// Removes from `text` everything up to and including the first separator. Returns the part before
+// the separator.
 std::string_view takePart(std::string_view& text, char separator) {
   const std::size_t end = text.find(separator);
   const std::string_view part = text.substr(0, end);
@@ -15,7 +16,7 @@ std::string_view takePart(std::string_view& text, char separator) {
   return part;
 }
 
-// The value with its %XX escapes decoded; none if an escape is malformed.
+// Returns the value with its %XX escapes decoded, or std::nullopt if an escape is malformed.
 std::optional<std::string> unescaped(std::string_view value) {
   std::string result;
   while (!value.empty()) {
@@ -78,7 +79,7 @@ std::string busAddressOf(BusKind bus) {
     }
     case BusKind::kSystem: {
       const std::string address = environment("DBUS_SYSTEM_BUS_ADDRESS");
-      // The path of the system bus that D-Bus defines.
+      // D-Bus defines this path for the system bus.
       return address.empty() ? "unix:path=/run/dbus/system_bus_socket" : address;
     }
   }

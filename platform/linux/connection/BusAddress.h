@@ -17,12 +17,12 @@ struct BusSocket {
   friend bool operator==(const BusSocket&, const BusSocket&) = default;
 };
 
-// The Unix sockets in a D-Bus address list, in the order of the list. Skips entries of other
-// transports and malformed entries.
+// Returns the Unix sockets in a D-Bus address list, in the order of the list. Skips entries of
+// other transports and malformed entries.
 std::vector<BusSocket> parseBusAddress(std::string_view addresses);
 
-// The address of a bus: from the environment, else the default one. Empty for kNone, and for a
-// session bus that the environment does not name.
+// Returns the address of a bus: the one in the environment, or the default if the environment has
+// none. Empty for kNone, and for a session bus that the environment does not name.
 std::string busAddressOf(BusKind bus);
 
 // The bus that started a process.
@@ -32,8 +32,9 @@ struct StarterBus {
   friend bool operator==(const StarterBus&, const StarterBus&) = default;
 };
 
-// The bus that started this process, as the environment names it; none if no bus did. A systemd
-// unit that starts the service on behalf of a bus may set the kind without the address.
+// Returns the bus that started this process, according to the environment; std::nullopt if no bus
+// did. If a systemd unit starts the service on behalf of a bus, the environment may have the kind
+// of the bus without its address. The address is then that of busAddressOf().
 std::optional<StarterBus> starterBus();
 
 }  // namespace halvox::platform::linux_

@@ -16,8 +16,8 @@ namespace {
 
 constexpr UnitLog kLog{connectionCategory, "BusConnection"};
 
-// The credentials in the bus's answer. What the bus does not say stays unknown; about a sender that
-// has left, it says nothing.
+// Returns the credentials in the bus's answer. A number that the answer lacks stays unknown. If the
+// sender has left, the answer is an error and both numbers stay unknown.
 PeerCredentials credentialsIn(const dbus::Frame& answer) {
   std::vector<Value> values;
   if (answer.header.type != dbus::MessageType::kMethodReturn ||
@@ -47,7 +47,8 @@ BusConnection::~BusConnection() { abandon(); }
 
 void BusConnection::start() {
   stream_.setReading(true);
-  // The socket does not become readable because of messages that the connector has already read.
+  // The connector has already read some messages. The socket does not become readable because of
+  // them, and the loop would not call onReadable().
   handleFrames();
   stream_.input().settle();
 }
@@ -88,13 +89,13 @@ void BusConnection::handleFrames() {
     next.state == FrameBuffer::State::kOversized ? handleOversized(next) : handleFrame(next);
     stream_.input().consume(next.totalBytes);
   }
-  // Deliver after all frames of the read have been sorted by sender: each sender then gets its
-  // share of the turn.
+  // Deliver only after all frames of this read have been sorted by sender. Each sender then gets
+  // its share of the turn.
   for (const std::shared_ptr<BusSender>& sender : std::exchange(touched_, {})) {
     sender->deliverReceived();
   }
-  // The bus reads our replies at its own pace. Until it has, do not read more requests, because
-  // each adds a reply.
+  // The bus reads our replies at its own pace. While too many are unread, do not read more
+  // requests, because each request adds a reply.
   if (stream_.output().unsentBytes() >= kMaxUnreadReplyBytes) stream_.setReading(false);
 }
 
@@ -108,7 +109,8 @@ void BusConnection::handleFrame(const FrameBuffer::Next& next) {
     case dbus::MessageType::kMethodCall: {
       std::shared_ptr<BusSender> sender = senderNamed(frame.header.sender);
       sender->receive(frame.header, next.bytes);
-      // A sender may be in the list twice. The second delivery finds nothing.
+      // Only the last element is compared. A sender may therefore be in the list twice, and its
+      // second delivery finds nothing.
       if (touched_.empty() || touched_.back() != sender) touched_.push_back(std::move(sender));
       break;
     }
@@ -125,8 +127,8 @@ void BusConnection::handleFrame(const FrameBuffer::Next& next) {
 void BusConnection::handleOversized(const FrameBuffer::Next& next) {
   const std::vector<std::byte> header = FrameBuffer::withoutBody(next);
   const std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(header);
-  // If the header cannot be read, the sender is not known and gets no answer. A bus does not
-  // forward such messages.
+  // A frame whose header cannot be read gets no answer, because the header names the sender. A bus
+  // does not forward such frames.
   if (const auto* frame = std::get_if<dbus::Frame>(&read); frame != nullptr) {
     senderNamed(frame->header.sender)->receiveOversized(next);
   }
@@ -135,7 +137,7 @@ void BusConnection::handleOversized(const FrameBuffer::Next& next) {
 void BusConnection::handleSignal(const dbus::Frame& frame) {
   const dbus::MessageHeader& header = frame.header;
   const bool isFromBus = header.sender == bus_names::kBus && header.interface == bus_names::kBus;
-  // Any sender can send such a signal to our name. Only the bus knows which one has left.
+  // Any sender can send a signal of this name to us. Only the bus knows which sender has left.
   if (!isFromBus || header.member != "NameOwnerChanged") return;
   std::vector<Value> names;  // the name, its old owner, its new one
   if (dbus::decodeBody(frame, "sss", names).has_value() || !names[2].string().empty()) return;

@@ -20,13 +20,13 @@ namespace halvox::platform::linux_ {
 class BusSender;
 class ConnectionHost;
 
-// The service's connection to a bus. Gives each sender on the bus a BusSender, asks the bus for the
-// sender's credentials, and hands it the sender's requests.
+// The service's connection to a bus. Makes a BusSender for each sender on the bus, asks the bus for
+// the sender's credentials, and passes the sender's requests to the BusSender.
 //
 //   started --the bus closes or breaks the rules--> lost: all senders end, an error is logged
 //
-// A lost bus is not joined again before the next start of the service: the bus has released our
-// name by then, and another process may have it. Belongs to the I/O thread. Owned by the host.
+// The service does not join a lost bus again before its next start: the bus has released our name,
+// and another process may own it now. Belongs to the I/O thread. Owned by the host.
 class BusConnection final : private StreamOwner {
  public:
   // Does not own the host, which must outlive this.
@@ -36,10 +36,11 @@ class BusConnection final : private StreamOwner {
   ~BusConnection() override;
 
   void start();
-  // Releases all senders without calling their handlers, because the service ends.
+  // Releases all senders without calling their handlers. Called when the service ends.
   void abandon();
 
-  // For senders. A sender that waits continues when the stream has room again.
+  // For senders. A sender that waits calls noteWaitingSender(), and continues after the bus has
+  // read half of the unread replies.
   [[nodiscard]] SocketStream& stream() { return stream_; }
   void forget(const BusSender& sender);
   void noteWaitingSender() { someSenderWaits_ = true; }
@@ -59,7 +60,7 @@ class BusConnection final : private StreamOwner {
   SocketStream stream_;
   std::map<std::string, std::shared_ptr<BusSender>, std::less<>> senders_;
   std::unordered_map<std::uint32_t, std::weak_ptr<BusSender>> questions_;  // by serial
-  std::vector<std::shared_ptr<BusSender>> touched_;  // have received requests from this read
+  std::vector<std::shared_ptr<BusSender>> touched_;  // those with requests in this read
   bool someSenderWaits_ = false;
   bool lost_ = false;
 };

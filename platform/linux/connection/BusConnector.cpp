@@ -35,8 +35,8 @@ Result<UniqueFd> connectTo(const BusSocket& bus) {
   const std::size_t start = bus.space == BusSocket::Space::kAbstract ? 1 : 0;
   if (bus.name.size() + start >= sizeof address.sun_path) return failure(ENAMETOOLONG);
   std::memcpy(&address.sun_path[start], bus.name.data(), bus.name.size());
-  // The length marks the end of an abstract name; a file path ends with a NUL. Either way the
-  // address takes one byte more than the name.
+  // An abstract name has a NUL in front, a file path has one at its end. In both cases the address
+  // is one byte longer than the name.
   const std::size_t length = offsetof(sockaddr_un, sun_path) + bus.name.size() + 1;
   UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0));
   if (!fd) return failure(errno);
@@ -53,20 +53,20 @@ BusConnector::BusConnector(std::string busName)
     : busName_(std::move(busName)), input_(dbus::kMaxMessageBytes) {}
 
 Result<BusSession, ConnectionOpenError> BusConnector::connect(const std::string& address) {
-  // One deadline for all steps: a bus that answers each step slowly must not delay the start for
-  // long either.
+  // Use one deadline for all steps. With a deadline for each step, a bus that answers every step
+  // slowly could delay the start for long.
   deadline_ = std::chrono::steady_clock::now() + kBusTimeout;
   if (Outcome done = connectToFirst(address); !done) return std::move(done).error();
   if (Outcome done = authenticate(); !done) return std::move(done).error();
   const auto ignore = [](const Value&) -> Outcome { return {}; };
   if (Outcome done = call("Hello", "", {}, "s", ignore); !done) return std::move(done).error();
   const std::array rule = {Value(kVanishingNames)};
-  // Ask for these signals before the name. Once the name is ours, a sender can call and leave. The
-  // signal of its leaving must not be missed.
+  // Ask for these signals before asking for the name. Once the service owns the name, a sender can
+  // call it and leave, and the service must not miss the signal that the sender has left.
   if (Outcome done = call("AddMatch", "s", rule, "", ignore); !done) return std::move(done).error();
   if (Outcome done = requestName(); !done) return std::move(done).error();
   const std::span<const std::byte> rest = input_.unused();
-  // Requests may have arrived right after the name became ours.
+  // The rest may be requests that arrived right after the service got the name.
   kept_.insert(kept_.end(), rest.begin(), rest.end());
   return BusSession{.fd = std::move(fd_), .unused = std::move(kept_), .lastSerial = lastSerial_};
 }
@@ -74,8 +74,8 @@ Result<BusSession, ConnectionOpenError> BusConnector::connect(const std::string&
 BusConnector::Outcome BusConnector::connectToFirst(const std::string& address) {
   address_ = address;
   std::string reasons;
-  // An address may list several sockets. The first one that accepts is the bus. The error has the
-  // reasons of all attempts, because any of them may be the cause.
+  // An address may list several sockets. Use the first one that accepts the connection. If none
+  // does, the error has the reasons of all attempts, because any of them may be the cause.
   for (const BusSocket& socket : parseBusAddress(address)) {
     Result<UniqueFd> connected = connectTo(socket);
     if (connected) {
@@ -105,7 +105,7 @@ BusConnector::Outcome BusConnector::authenticate() {
       case dbus::HandshakeState::kContinue:
         break;
       case dbus::HandshakeState::kDone:
-        // The last line, BEGIN, must leave before the first message.
+        // D-Bus requires the line BEGIN, which is in `output`, before the first message.
         return send(output);
       case dbus::HandshakeState::kFailed:
         return unreachable("the handshake failed: " + progress.error);
@@ -162,7 +162,7 @@ Result<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::uint32
       input_.settle();
       continue;
     }
-    // Copy the frame, because the result points into it and consuming changes the buffer.
+    // Copy the frame: the result points into it, and consume() may overwrite the original.
     answer_.assign(next.bytes.begin(), next.bytes.end());
     input_.consume(next.totalBytes);
     std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(answer_);
@@ -171,7 +171,7 @@ Result<dbus::Frame, ConnectionOpenError> BusConnector::waitForAnswer(std::uint32
     }
     const dbus::Frame& frame = std::get<dbus::Frame>(read);
     if (frame.header.replySerial == serial) return frame;
-    // This message is a signal or an early request. The connection handles it later.
+    // This message is a signal or an early request. BusConnection handles it later.
     kept_.insert(kept_.end(), answer_.begin(), answer_.end());
   }
 }

@@ -22,14 +22,14 @@ namespace halvox::platform::linux_ {
 // A connection to a bus on which the service owns its name.
 struct BusSession {
   UniqueFd fd;                    // non-blocking
-  std::vector<std::byte> unused;  // messages that arrived before the answers, to be handled next
+  std::vector<std::byte> unused;  // other messages that arrived, to be handled next
   std::uint32_t lastSerial = 0;
 };
 
-// Connects to a bus: the handshake, Hello, a match rule for senders that leave, and the service's
-// name. One object connects once. Blocks the calling thread for at most kBusTimeout (5 s) in all,
-// and is therefore only used before the service accepts clients. A failure names the address and
-// the reason.
+// Connects to a bus: performs the handshake, sends Hello, adds a match rule for senders that leave,
+// and requests the service's name. One object connects once. Blocks the calling thread for at most
+// kBusTimeout (5 s) in all, and is therefore used only before the service accepts clients. The
+// error of a failure names the address and the reason.
 class BusConnector {
  public:
   explicit BusConnector(std::string busName);
@@ -48,7 +48,8 @@ class BusConnector {
   Outcome call(std::string_view member, std::string_view signature,
                std::span<const Value> arguments, std::string_view answerSignature,
                const std::function<Outcome(const Value&)>& take);
-  // Waits for the answer to the call with that serial. Keeps all other messages for the session.
+  // Waits for the answer to the call with that serial. Stores all other messages for
+  // BusSession::unused.
   Result<dbus::Frame, ConnectionOpenError> waitForAnswer(std::uint32_t serial);
   Outcome send(std::string_view bytes);
   Outcome receive();

@@ -30,8 +30,8 @@ std::string BusSender::description() const {
 
 void BusSender::receive(const dbus::MessageHeader& header, std::span<const std::byte> frame) {
   const std::size_t waiting = input_.unused().size();
-  // One request is always accepted, up to the size limit of frames: the bound is for requests that
-  // pile up.
+  // If no other request waits, accept a request of any size up to the limit of frames. The bound is
+  // only for requests that pile up.
   if (waiting == 0 || waiting + frame.size() <= kMaxWaitingBytesOfSender) {
     input_.append(frame);
     return;
@@ -45,7 +45,8 @@ void BusSender::receive(const dbus::MessageHeader& header, std::span<const std::
 void BusSender::receiveOversized(const FrameBuffer::Next& next) { refuseOversized(next); }
 
 void BusSender::deliverReceived() {
-  // Skip a sender that flow control holds back. It becomes due when it has room again.
+  // Skip a sender that flow control holds back. The sender continues when enough of its requests
+  // have been carried out.
   if (wantsInput()) deliver();
 }
 
@@ -59,13 +60,15 @@ void BusSender::onCredentials(const PeerCredentials& credentials) {
 }
 
 void BusSender::onVanished() {
-  // Deliver the remaining requests: the sender may have sent a message and left on purpose.
+  // Deliver the remaining requests, because the sender may have left on purpose after its last
+  // message.
   vanished_ = true;
   deliverReceived();
 }
 
 void BusSender::onBusLost() {
-  // An unknown sender has no handlers to call, because the delegate has not been asked about it.
+  // The delegate sets the handlers, and it has not been asked about a sender that is still unknown.
+  // Such a sender has no handlers to call.
   isKnown_ ? end(Why::kPeerVanished) : abandon();
 }
 
@@ -81,8 +84,8 @@ void BusSender::onDelivered(bool /*begun*/, bool /*progress*/) {
 
 void BusSender::onFinished() { bus_.forget(*this); }
 
-// Does not close the connection: all senders share it. The bus forwards only valid frames, which
-// means that the stream is still intact.
+// Does not close the connection, because all senders share it. The stream is still intact, because
+// the bus forwards only valid frames.
 void BusSender::onMalformed(const std::string& what) {
   kLog.error("dropped a message of ", description(), ": not a valid D-Bus message: ", what);
   host().statistics().connectionsMalformed.add();

@@ -11,17 +11,18 @@ namespace halvox::platform::linux_ {
 
 class BusConnection;
 
-// One sender on the bus. Each counts as a connection of its own.
+// One sender on the bus. To the service, each sender is a client connection of its own.
 //
 //   unknown --credentials, or the handshake timeout--> known: the delegate is asked, requests are
 //       delivered --the name vanishes--> ended
 //
-// Its requests arrive on the bus's connection. They wait here until the bus has said who the sender
-// is, and while flow control holds the sender back. The bus cannot hold back one sender: requests
-// beyond kMaxWaitingBytesOfSender are refused. Replies that the sender does not read are kept and
-// bounded by the bus. A sender that left before the bus could answer is served as process 0 of an
-// unknown user, because some of its requests may need no reply. Belongs to the I/O thread. Shared
-// by the bus's connection and the delegate.
+// The sender's requests arrive on the connection of the bus. They wait here until the bus has sent
+// the sender's credentials, and while flow control holds the sender back. The service cannot stop
+// reading from one sender alone, because all senders share the connection. It therefore refuses
+// requests beyond kMaxWaitingBytesOfSender. The bus stores, and bounds, the replies that the sender
+// does not read. If a sender leaves before the bus has sent its credentials, its requests are
+// served as those of process 0 of an unknown user: some of them may need no reply. Belongs to the
+// I/O thread. Shared by the bus's connection and the delegate.
 class BusSender final : public ClientConnection, private DeadlineOwner {
  public:
   BusSender(ConnectionHost& host, BusConnection& bus, std::string name);
@@ -36,12 +37,12 @@ class BusSender final : public ClientConnection, private DeadlineOwner {
   void receiveOversized(const FrameBuffer::Next& next);
   // Delivers what has been received, unless flow control holds the sender back.
   void deliverReceived();
-  // The bus has given the sender's credentials, or has not answered in time.
+  // Called when the bus has sent the sender's credentials or has not answered in time.
   void onCredentials(const PeerCredentials& credentials);
-  // The bus reports that the name has lost its owner.
+  // Called when the bus reports that the sender has left.
   void onVanished();
   void onBusLost();
-  // The bus has read some of the replies.
+  // Called when the bus has read some of the replies.
   void onStreamRoom() { onOutputRoom(); }
 
  private:

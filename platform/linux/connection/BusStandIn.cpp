@@ -1,6 +1,6 @@
-// Answers the requests that clients send to their bus. Clients on our own socket have no bus, and
-// the service answers them itself. The service is known under its well-known name and as ":1.0",
-// the client as ":1.N".
+// Answers the requests that clients on our own socket send to "their bus". These clients have no
+// bus, and the service answers in its place. To such a client, the service has its well-known name
+// and the unique name ":1.0". Client number N has the unique name ":1.N".
 
 #include <array>
 #include <cstdint>
@@ -25,7 +25,7 @@ std::string uniqueNameOf(const ClientConnection& client) {
   return ":1." + std::to_string(client.number());
 }
 
-// The unique name of the owner of a name; none if it has no owner.
+// Returns the unique name of the owner of `name`, or std::nullopt if the name has no owner.
 std::optional<std::string> ownerOf(const StandardRequest& request, std::string_view name) {
   if (name == request.identity.busName || name == kOwnUniqueName) {
     return std::string(kOwnUniqueName);
@@ -41,8 +41,8 @@ StandardAnswer nobodyHas(std::string_view name) {
 }
 
 StandardAnswer hello(const StandardRequest& request) {
-  // D-Bus allows one Hello for each connection. Libraries send it without asking whether there is a
-  // bus.
+  // D-Bus allows one Hello for each connection. Client libraries send Hello even if the other side
+  // is not a bus.
   if (request.client.takeHello()) return {.value = Value(uniqueNameOf(request.client))};
   return {.errorName = error_names::kFailed, .errorText = "the connection already has its name"};
 }
@@ -86,7 +86,8 @@ StandardAnswer getConnectionUnixProcessId(const StandardRequest& request) {
   const std::optional<std::string> owner = ownerOf(request, name);
   if (!owner.has_value()) return nobodyHas(name);
   const bool isClient = *owner == uniqueNameOf(request.client);
-  // All other names with an owner belong to the service.
+  // Every other name that has an owner belongs to the service or to this stand-in, which is the
+  // same process.
   return {.value = Value(static_cast<std::uint32_t>(isClient ? request.client.processIdentifier()
                                                              : getpid()))};
 }

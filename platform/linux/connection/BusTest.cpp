@@ -41,7 +41,7 @@ constexpr const char* kBusConfiguration = R"(
 </busconfig>
 )";
 
-// A private bus, and the environment that names it.
+// Starts a private bus, and sets the environment variables that name it.
 class PrivateBus {
  public:
   PrivateBus() {
@@ -226,7 +226,7 @@ TEST_F(BusTest, WhatASenderSendsBeyondWhatMayWaitIsRefused) {
   flood(busy, kMaxOpenRequests, "busy");
   const std::string megabyte(1 * kMiB, 'a');
 
-  // The bus forwards all of them. None is delivered while the first requests are open.
+  // The bus forwards all of these requests. None is delivered while the first ones are open.
   for (int call = 0; call < 6; ++call) {
     BusMessage message;
     sd_bus_message_new_method_call(busy.get(), message.out(), kName, kTestPath, kTestInterface,

@@ -45,18 +45,18 @@ void ClientConnection::resume() {
   if (state_ != State::kNotResumed) return;
   state_ = State::kReading;
   setReading(true);
-  // Requests that came together with the end of the handshake are already read. The socket will not
-  // become readable because of them.
+  // Requests that came together with the end of the handshake have been read already. The socket
+  // does not become readable because of them, and nothing else would start their delivery.
   if (!input().unused().empty()) becomeDue();
 }
 
 void ClientConnection::deliver() {
-  // The delegate has not yet accepted or refused this client.
+  // Before resume(), the delegate has not yet accepted this client.
   if (state_ == State::kNotResumed) setReading(false);
   if (state_ == State::kNotResumed || state_ == State::kEnded) return input().settle();
   state_ = State::kReading;
-  // While too many messages wait for the store, a client that has more than a short share waits
-  // until the store has caught up. Clients that send little are not slowed down.
+  // While too many messages wait for the store, a client that sends more than a short share waits
+  // until the store has caught up. A client that sends less is not slowed down.
   const bool pressed = host_.backpressure().isHigh();
   std::size_t requestsLeft = pressed ? kShortTurnRequests : host_.turn().requestsPerClient();
   std::size_t bytes = 0;
@@ -66,12 +66,12 @@ void ClientConnection::deliver() {
       onDelivered(next.state == FrameBuffer::State::kPartial, bytes > 0);
       break;
     }
-    // Test this only with a whole frame: a client without a request need not wait. Test it before
-    // the share: a client that is due is visited in every turn, which is useless while it must
-    // wait.
+    // Call mustWait() only if there is a whole frame, because a client without a request need not
+    // wait. Call it before testing the share: the next turn would visit a client whose share is
+    // used up, in vain if the client must wait.
     if (mustWait()) break;
-    // Count only what was delivered before this frame: a frame that is larger than a whole share
-    // must be delivered, too.
+    // `bytes` does not include this frame. A frame that is larger than a whole share is therefore
+    // delivered, too.
     if (requestsLeft == 0 || bytes >= kTurnBytes) {
       pressed ? waitInState(State::kWaitingForRelief) : becomeDue();
       break;
@@ -82,7 +82,7 @@ void ClientConnection::deliver() {
     --requestsLeft;
   }
   if (object_ != nullptr) object_->endOfRequests();
-  // Needed in every turn: the next client reads into the same scratch.
+  // Do this after every delivery, because the next client reads into the same scratch.
   input().settle();
 }
 
@@ -101,15 +101,15 @@ ClientConnection::Step ClientConnection::deliverFrame(const FrameBuffer::Next& n
     onMalformed(error->message + " at byte " + std::to_string(error->offset));
     return Step::kStop;
   }
-  // A delivery queues jobs. Only inside a batch can this thread run them itself and wake the pool
-  // once for all.
+  // A delivery adds jobs to queues. Only inside a batch can this thread run these jobs itself, and
+  // wake the pool once for all of them.
   host_.turn().beforeDelivery();
   host_.dispatcher().dispatch(*this, std::get<dbus::Frame>(read), next.totalBytes);
   return hasEnded() ? Step::kStop : Step::kGoOn;
 }
 
-// Reads only the header, as if the message had no body, to find out what to answer. The body is
-// dropped as it arrives and never kept in memory.
+// To learn what to answer, reads the header as if the message had no body. The bytes of the body
+// are dropped as they arrive and are never kept in memory.
 void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
   const std::vector<std::byte> header = FrameBuffer::withoutBody(next);
   const std::variant<dbus::Frame, dbus::WireError> read = dbus::readFrame(header);
@@ -117,7 +117,7 @@ void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
     return onMalformed(error->message + " at byte " + std::to_string(error->offset));
   }
   const dbus::MessageHeader& request = std::get<dbus::Frame>(read).header;
-  // Only calls have an answer.
+  // Only method calls are answered.
   if (request.type != dbus::MessageType::kMethodCall) return;
   host_.statistics().requestsReceived.add();
   refuse(request, Refusal::kTooLarge, error_names::kLimitsExceeded,
@@ -126,8 +126,8 @@ void ClientConnection::refuseOversized(const FrameBuffer::Next& next) {
 }
 
 bool ClientConnection::mustWait() {
-  // wait() returns false if requests have been completed in between. This client would then not be
-  // woken, and must go on.
+  // wait() returns false if another thread has completed enough requests since isFull(). Nothing
+  // would then wake this client, and it must continue at once.
   if (link_->flow().isFull() && link_->flow().wait()) {
     waitInState(State::kWaitingForRoom);
     return true;
@@ -162,8 +162,8 @@ void ClientConnection::onRelief() {
 void ClientConnection::onOutputRoom() {
   if (state_ != State::kWaitingForReader) return;
   const OutputQueue& output = stream().output();
-  // The gap between this and the bound keeps a slow reader from stopping and starting with each
-  // reply.
+  // Wait until half of the replies are read. If the client continued just below the bound, a slow
+  // reader would stop and start again with every reply.
   if (output.unsentFrames() > kMaxUnreadReplies / 2) return;
   if (output.unsentBytes() > kMaxUnreadReplyBytes / 2) return;
   becomeDue();
@@ -173,15 +173,15 @@ void ClientConnection::end(Why why) {
   if (state_ == State::kEnded) return;
   state_ = State::kEnded;
   why_ = why;
-  // The handlers run in the next turn, because end() may be called during a delivery whose replies
-  // still have to be sent.
+  // finish() calls the handlers in the next turn, because end() may be called during a delivery
+  // whose replies still have to be sent.
   onEnded();
   host_.turn().finishNext(shared_from_this());
 }
 
 void ClientConnection::finish() {
-  // The port promises this order. It promises an interruption only if the other side has ended the
-  // connection.
+  // platform/connection.h promises this order of the handlers, and promises the interruption only
+  // if the other side has ended the connection.
   if (why_ == Why::kPeerVanished && interruptionHandler_) interruptionHandler_();
   if (invalidationHandler_) invalidationHandler_();
   if (unloggedRefusals_ > 0) {
@@ -201,8 +201,8 @@ void ClientConnection::abandon() {
 }
 
 void ClientConnection::letGo() {
-  // Detach first: the objects that are released below can answer requests, and those replies must
-  // not come back here.
+  // Detach first. The objects that are released below can answer requests, and those replies must
+  // not reach a connection that has finished.
   link_->detach();
   interruptionHandler_ = nullptr;
   invalidationHandler_ = nullptr;

@@ -52,19 +52,19 @@ class ClientConnection : public NSXPCConnection,
   void setInvalidationHandler(std::function<void()> handler) override;
   void resume() override;
 
-  // Delivers the requests that have arrived, at most this turn's share.
+  // Delivers the requests that have arrived, at most the client's share of this turn.
   void deliver();
-  // Half of the open requests have been carried out.
+  // Called when half of the open requests have been carried out.
   void onRoom();
   // The store has caught up.
   void onRelief();
-  // Ends the connection: nothing more is read. finish() follows in the next turn, after the last
-  // replies have been written.
+  // Ends the connection. Reads nothing more. The schedule calls finish() in the next turn, after
+  // the last replies have been written.
   void end(Why why);
-  // Calls the handlers and releases everything. Called by the schedule.
+  // Calls the handlers and releases everything. Called by TurnSchedule.
   void finish();
-  // Releases everything without calling the handlers, because the delegate has refused the
-  // connection or the service ends.
+  // Releases everything without calling the handlers. Called if the delegate refuses the connection
+  // and when the service ends.
   void abandon();
 
   // For the code that answers requests.
@@ -80,11 +80,11 @@ class ClientConnection : public NSXPCConnection,
   // reply.
   void refuse(const dbus::MessageHeader& request, Refusal reason, std::string_view errorName,
               const std::string& text);
-  // The client broke the rules of the wire. `what` describes how and at which byte.
+  // Called when the client broke the rules of the wire. `what` says which rule and at which byte.
   virtual void onMalformed(const std::string& what);
 
-  // Returns true for a client on our own socket. It has no bus: the service answers its calls to
-  // the bus.
+  // Returns true for a client on our own socket. Such a client has no bus, and the service answers
+  // the calls that it sends to the bus.
   [[nodiscard]] virtual bool isPeerToPeer() const = 0;
   // Returns true only at the first call: a client must send Hello to the bus exactly once.
   [[nodiscard]] bool takeHello();
@@ -94,16 +94,16 @@ class ClientConnection : public NSXPCConnection,
   [[nodiscard]] virtual SocketStream& stream() = 0;
   // The bus name of the client; empty without a bus.
   [[nodiscard]] virtual std::string_view replyDestination() const = 0;
-  // Says whether this client wants more input.
+  // Starts or stops reading from this client.
   virtual void setReading(bool reading) = 0;
-  // All whole frames have been delivered. `begun`: part of another frame is there. `progress`: at
-  // least one frame was delivered this time.
+  // Called when all whole frames have been delivered. `begun` is true if a part of another frame
+  // has arrived, `progress` if this delivery had at least one frame.
   virtual void onDelivered(bool begun, bool progress) = 0;
-  // The connection ended or was abandoned. The subclass stops its input.
+  // Called when the connection has ended or was abandoned. The subclass stops its input.
   virtual void onEnded() = 0;
   virtual void onFinished() = 0;
 
-  // The socket has taken some of the output.
+  // The subclass calls this when the socket has taken some of the output.
   void onOutputRoom();
   // Refuses a request that is larger than the limit.
   void refuseOversized(const FrameBuffer::Next& next);

@@ -44,7 +44,8 @@ void ReplyTicket::answer(const std::shared_ptr<ReplyTicket>& ticket,
     return;
   }
   Inbox& inbox = ticket->client_->inbox();
-  // The usual case: a brief job that this thread helped with. The reply needs no copy and no lock.
+  // In the usual case the I/O thread itself has run the job that answers. The reply then needs no
+  // copy and no lock.
   if (inbox.isLoopThread()) {
     ticket->deliver(error.has_value() ? &*error : nullptr, value);
     return;

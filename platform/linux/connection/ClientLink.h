@@ -15,8 +15,9 @@ namespace halvox::platform::linux_ {
 
 class ClientConnection;
 
-// What requests and replies share with their client's connection. They can outlive the connection,
-// and other threads hold them. They must therefore not refer to the connection itself.
+// The link from requests and replies to their client's connection. Requests and replies can outlive
+// the connection, and other threads hold them. They therefore refer to this object and not to the
+// connection itself.
 //
 //   attached (the connection exists) --detach()--> detached: replies are dropped and counted
 //
@@ -30,20 +31,21 @@ class ClientLink final : public RequestSource, public std::enable_shared_from_th
   [[nodiscard]] Inbox& inbox() { return *inbox_; }
   [[nodiscard]] ConnectionStatistics& statistics() { return *statistics_; }
 
-  // A request has been carried out. Any thread may call it.
+  // Called when a request has been carried out. Any thread may call it.
   void requestDone(FlowControl::Cost cost) {
     if (flow_.close(cost)) inbox_->postRoom(shared_from_this());
   }
 
-  // On the I/O thread, where helped jobs run, the reply is encoded at once and written at the end
-  // of the turn. Other threads post it to the I/O thread.
+  // On the I/O thread, encodes the reply at once; the reply is written at the end of the turn. On
+  // any other thread, posts the reply to the I/O thread.
   void answer(const RequestMark& mark, const std::optional<Error>& error,
               const Value& value) override;
   void carriedOut(const RequestMark& mark) override {
     requestDone({.requests = mark.weight, .bytes = mark.bytes});
   }
 
-  // Hands a reply to the connection unless it has finished. I/O thread only.
+  // Passes a reply to the connection, or drops and counts the reply if the connection has finished.
+  // Only for the I/O thread.
   void deliver(std::uint32_t serial, std::string_view signature, const Error* error,
                const Value& value);
   // Returns the connection, or null after it has finished. Only for the I/O thread.
@@ -58,7 +60,8 @@ class ClientLink final : public RequestSource, public std::enable_shared_from_th
   ClientConnection* connection_ = nullptr;
 };
 
-// What a RequestToken points to: the request is open while this exists. Destroyed on any thread.
+// The object that a RequestToken points to. The request is open while this object exists. Any
+// thread may destroy it.
 class OpenRequest {
  public:
   OpenRequest(std::shared_ptr<ClientLink> client, FlowControl::Cost cost)
@@ -74,18 +77,20 @@ class OpenRequest {
   FlowControl::Cost cost_;
 };
 
-// The right to answer one request once. All copies of the request's ReplyCallback share it.
+// The right to answer one request once. All copies of the request's ReplyCallback share one ticket.
 class ReplyTicket {
  public:
   // `signature` is the signature of the reply, and must be a constant: it is not copied.
   ReplyTicket(std::shared_ptr<ClientLink> client, std::uint32_t serial, std::string_view signature)
       : client_(std::move(client)), serial_(serial), signature_(signature) {}
 
-  // Any thread may call it. On the I/O thread, where helped jobs run, the reply is encoded at once
-  // and written at the end of the turn. Other threads post it to the I/O thread.
+  // Any thread may call it. On the I/O thread, encodes the reply at once; the reply is written at
+  // the end of the turn. On any other thread, posts the reply to the I/O thread. Drops and counts
+  // every reply after the first.
   static void answer(const std::shared_ptr<ReplyTicket>& ticket, const std::optional<Error>& error,
                      const Value& value);
-  // Hands the reply to the connection, unless that has finished. Only for the I/O thread.
+  // Passes the reply to the connection, or drops and counts it if the connection has finished. Only
+  // for the I/O thread.
   void deliver(const Error* error, const Value& value);
 
  private:

@@ -74,7 +74,7 @@ class LinuxClient {
   std::unique_ptr<BusClient> client_;
 };
 
-// The service, which runs on a thread of its own.
+// A service that runs on a thread of its own.
 class LinuxHarness {
  public:
   using Client = LinuxClient;

@@ -32,14 +32,15 @@ std::string hexOf(const sd_id128_t& id) {
 ServiceIdentity makeIdentity(const std::string& busName) {
   ServiceIdentity identity{.guidHex = {}, .busName = busName, .machineHex = {}};
   sd_id128_t id;
-  // Clients use the GUID to recognise a server that they already know. If there are no random
-  // numbers, use zeros: the handshake only needs 32 digits.
+  // Clients use the GUID to recognise a server that they already know. If the system provides no
+  // random number, use zeros, because the handshake needs 32 digits of any value.
   identity.guidHex = sd_id128_randomize(&id) >= 0 ? hexOf(id) : std::string(32, '0');
   if (sd_id128_get_machine(&id) >= 0) identity.machineHex = hexOf(id);
   return identity;
 }
 
-// Every client takes a descriptor. The soft limit is usually 1,024, the hard limit much higher.
+// Raises the soft limit of descriptors to the hard limit. Every client takes a descriptor, and the
+// soft limit is usually only 1,024.
 void allowMoreDescriptors() {
   rlimit limit{};
   if (getrlimit(RLIMIT_NOFILE, &limit) != 0) return;
@@ -62,9 +63,9 @@ ConnectionHost::ConnectionHost(ConnectionOptions options, Backpressure& backpres
       messages_(options_.messageTimeout),
       acceptRetries_(kAcceptRetryDelay),
       turn_(options_.beginBatch, options_.endBatch, options_.afterReplies) {
-  // Block the signals in the constructor, because threads inherit the mask. A thread that was
-  // started earlier would receive the signal that the loop waits for, and the signal would kill the
-  // process.
+  // Block the signals here and not in open(): only threads that are started later inherit the mask.
+  // A thread without the mask would receive the signal instead of the loop, and the signal would
+  // kill the process.
   if (options_.signals == EndSignals::kHandle) SignalWatch::block();
   backpressure_.setReliefHandler([inbox = inbox_] { inbox->postRelief(); });
 }
@@ -112,18 +113,20 @@ Result<void, ConnectionOpenError> ConnectionHost::openSockets() {
 Result<void, ConnectionOpenError> ConnectionHost::openBuses() {
   const std::optional<StarterBus>& starter = options_.starter;
   const bool wantsBus = options_.bus != BusKind::kNone;
-  // Join each bus only once: it gives a name to one connection only.
+  // Join each bus only once, because a bus gives a name to only one connection.
   const bool isStartersBus = wantsBus && starter.has_value() && starter->kind == options_.bus;
   if (wantsBus) {
     auto joined = joinBus(isStartersBus ? starter->address : busAddressOf(options_.bus));
     if (!joined) return joined;
   }
   if (!starter.has_value() || isStartersBus) return {};
-  // Start even if this bus cannot be joined. The address comes from environment variables. A
-  // terminal that a bus has started passes them on to every program, for which they may be wrong.
+  // Start even if this bus cannot be joined. Its address comes from environment variables that
+  // child processes inherit. If a bus has started a terminal, every program in that terminal has
+  // these variables, although the bus did not start those programs.
   if (const auto joined = joinBus(starter->address); !joined) {
     kLog.error("cannot join the bus that started the service: ", joined.error().message,
-               "; clients reach it through its socket", wantsBus ? " and listener.bus" : "");
+               "; clients reach the service through its socket",
+               wantsBus ? " and listener.bus" : "");
   } else {
     kLog.notice("serving the bus that started the service, ", starter->address);
   }
@@ -143,7 +146,8 @@ void ConnectionHost::resume() {
         "resume() was called before open() succeeded or without a delegate; serving nothing");
     return;
   }
-  // Set before the first turn: replies that are given on this thread must not go through the mail.
+  // Do this before the first turn: a reply that is given on this thread must not go through the
+  // inbox.
   inbox_->attachToThisThread();
   for (const auto& bus : buses_) bus->start();
   kLog.info("serving ", listeners_.size(), " sockets and ", buses_.size(), " buses");
@@ -160,15 +164,17 @@ void ConnectionHost::takeTurn() {
   turn_.begin();
   const std::size_t ready =
       loop_.runOnce(sleeps ? EventLoop::Wait::kBlock : EventLoop::Wait::kPoll);
-  // Note this before anything else: posts during this turn then need no system call.
+  // Call awake() first. Other threads then post to the inbox without a system call during this
+  // turn.
   if (sleeps) inbox_->awake();
-  // Check the deadlines after the events: a message that has just arrived completely is in time.
+  // Check the deadlines after the events. A message whose last bytes have just arrived is then in
+  // time.
   expireDeadlines();
   turn_.deliver(ready);
   turn_.finishEnded();
   turn_.endDeliveries();
-  // Read the mail after the batch and before the writes: replies of other threads then leave
-  // together with ours.
+  // Read the inbox after the batch and before the writes. The replies of other threads then leave
+  // together with the replies of this thread.
   readMail();
   turn_.flush();
   turn_.reap();
@@ -186,7 +192,7 @@ std::optional<DeadlineQueue::Clock::time_point> ConnectionHost::firstDeadline() 
 }
 
 void ConnectionHost::expireDeadlines() {
-  // Avoids reading the clock in most turns.
+  // Most turns have no deadline, and this saves them reading the clock.
   if (!firstDeadline().has_value()) return;
   const auto now = DeadlineQueue::Clock::now();
   for (DeadlineQueue* queue : {&handshakes_, &messages_, &acceptRetries_}) queue->expire(now);
@@ -198,7 +204,8 @@ void ConnectionHost::readMail() {
     reply.ticket->deliver(reply.error.get(), reply.value);
   }
   for (const std::shared_ptr<ClientLink>& client : mail_.clientsWithRoom) {
-    // The client may have disconnected since: requests outlive their connection.
+    // The client may have disconnected since the post, because a request can outlive its
+    // connection.
     if (client->connection() != nullptr) client->connection()->onRoom();
   }
   if (mail_.relieved) turn_.relieve();
@@ -229,14 +236,14 @@ bool ConnectionHost::admit(const std::shared_ptr<ClientConnection>& client) {
 
 void ConnectionHost::peerClosed(PeerConnection& peer) {
   peers_.erase(&peer);
-  // Accepting may be paused until a descriptor is free, and one is free now.
+  // A listener may have paused for lack of descriptors, and a descriptor is free now.
   for (const auto& listener : listeners_) listener->tryAgain();
 }
 
-// May be called again, and after an open() that failed half-way.
+// May be called more than once, and after an open() that failed half-way.
 void ConnectionHost::shutDown() {
-  // Close the inbox first: the objects that are released below post replies and notices of room
-  // that will not be read.
+  // Close the inbox first. The objects that are released below post replies and other notices,
+  // which the closed inbox drops.
   inbox_->close();
   turn_.clear();
   // Empty the map first, because an abandoned peer removes itself from it.

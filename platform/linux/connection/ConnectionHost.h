@@ -28,7 +28,7 @@ class PeerConnection;
 class SignalWatch;
 struct PeerCredentials;
 
-// What all connections of one service share, and the loop that serves them.
+// The parts that all connections of one service share, and the loop that serves the connections.
 //
 //   made --open()--> open --resume()--> serving --requestStop() or a signal--> shut down
 //
@@ -36,13 +36,13 @@ struct PeerCredentials;
 //   1. takes events: accepts, reads, decodes and delivers requests
 //   2. delivers for the clients that had more than their share in the last turn
 //   3. calls the handlers of connections that have ended
-//   4. ends the batch: this thread now runs the brief jobs that it queued (docs/decisions/0002)
+//   4. ends the batch: this thread now runs the brief jobs that it has queued (docs/decisions/0002)
 //   5. reads the mail of other threads
 //   6. writes: one system call for each connection with output. All replies of the turn leave
 //      together, including those of helped jobs and of mail
 //   7. wakes the pool for the queues that the jobs used
 //
-// The thread that calls resume() is the I/O thread, to which this belongs. Any thread may call
+// The host belongs to the I/O thread, which is the thread that calls resume(). Any thread may call
 // requestStop(). Owned by the connection service.
 class ConnectionHost final : public NSXPCListener {
  public:
@@ -63,7 +63,8 @@ class ConnectionHost final : public NSXPCListener {
   [[nodiscard]] const ReadScratch& scratch() const { return scratch_; }
   [[nodiscard]] OutputBufferPool& outputBuffers() { return outputBuffers_; }
   [[nodiscard]] const std::shared_ptr<Inbox>& inbox() const { return inbox_; }
-  // The headers of requests. Their texts are valid until the next one is read.
+  // The recent headers of requests. The texts of a header from this cache are valid until the next
+  // header is read.
   [[nodiscard]] dbus::HeaderCache& headers() { return headers_; }
   [[nodiscard]] RequestDispatcher& dispatcher() { return *dispatcher_; }
   [[nodiscard]] ConnectionStatistics& statistics() { return *statistics_; }
@@ -74,12 +75,13 @@ class ConnectionHost final : public NSXPCListener {
   [[nodiscard]] DeadlineQueue& messages() { return messages_; }
   [[nodiscard]] DeadlineQueue& acceptRetries() { return acceptRetries_; }
 
-  // A client has connected. Both ask the delegate, and return false if it refuses the client.
+  // Called when a client has connected. admit() asks the delegate, and returns false if the
+  // delegate refuses the client. acceptPeer() makes the connection of a peer and calls admit().
   void acceptPeer(UniqueFd fd, const PeerCredentials& credentials);
   [[nodiscard]] bool admit(const std::shared_ptr<ClientConnection>& client);
-  // The numbers of clients: 1, 2, ...
+  // Returns the numbers of clients: 1, 2, ...
   [[nodiscard]] std::uint64_t nextClientNumber() { return ++lastClientNumber_; }
-  // The descriptor of a peer was closed.
+  // Called when the descriptor of a peer was closed.
   void peerClosed(PeerConnection& peer);
 
  private:

@@ -23,17 +23,19 @@ enum class Refusal : std::uint8_t {
   kTooManyWaiting,
   kNotAllowed,
 };
-// Derived from the last enumerator. Update it with every new one.
+// The number of enumerators. Change the name here if another enumerator becomes the last one.
 inline constexpr std::size_t kRefusalKinds = static_cast<std::size_t>(Refusal::kNotAllowed) + 1;
 
 // The name of the refusal in the statistics.
 std::string_view nameOf(Refusal refusal);
 
-// The adapter's counters, looked up once: counting costs one relaxed addition. They balance:
+// The adapter's counters. They are looked up only once, and counting then costs one relaxed
+// addition. They balance:
 //   requests received = delivered + answered here + refused (by reason)
 //   replies given     = sent + dropped (by reason)
-// Bytes are those on the sockets, including handshakes. Any thread may count. The statistics
-// service owns the counters and must outlive this.
+// A request with a malformed body is received, but counted only by connectionsMalformed. Bytes are
+// those on the sockets, including handshakes. Any thread may count. The statistics service owns the
+// counters and must outlive this.
 struct ConnectionStatistics {
   explicit ConnectionStatistics(StatisticsService& service);
 

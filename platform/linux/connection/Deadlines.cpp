@@ -26,7 +26,7 @@ std::optional<DeadlineQueue::Clock::time_point> DeadlineQueue::first() const {
 void DeadlineQueue::expire(Clock::time_point now) {
   while (first_ != nullptr && first_->at_ <= now) {
     Deadline& due = *first_;
-    // Remove the deadline first, because its owner may start it again or destroy it.
+    // Remove the deadline first, because its owner may start the deadline again or destroy it.
     remove(due);
     due.owner_.onDeadline();
   }
@@ -47,7 +47,7 @@ bool LoopTimer::open(EventLoop& loop) {
 
 void LoopTimer::arrange(std::optional<std::chrono::steady_clock::time_point> due, Before before) {
   const bool tooLate = due.has_value() && (!setTo_.has_value() || *setTo_ > *due);
-  // If the next turn follows without a sleep, a useless timer costs nothing yet.
+  // Disable a useless timer only before a sleep. Until then it costs nothing.
   const bool needless = !due.has_value() && setTo_.has_value() && before == Before::kSleep;
   if (tooLate || needless) set(due);
 }
@@ -62,7 +62,8 @@ void LoopTimer::set(std::optional<std::chrono::steady_clock::time_point> due) {
   itimerspec setting{};
   if (due.has_value()) {
     using std::chrono::nanoseconds;
-    // The steady clock is CLOCK_MONOTONIC here: the kernel takes its times unchanged.
+    // On Linux the steady clock is CLOCK_MONOTONIC. Its times can therefore be passed to the kernel
+    // unchanged.
     const auto sinceStart = std::chrono::duration_cast<nanoseconds>(due->time_since_epoch());
     constexpr std::int64_t kNanosecondsPerSecond = 1'000'000'000;
     setting.it_value.tv_sec = sinceStart.count() / kNanosecondsPerSecond;

@@ -18,8 +18,8 @@ class DeadlineOwner {
   virtual void onDeadline() = 0;
 };
 
-// One deadline of an owner. Is in at most one queue. The destructor removes the deadline from its
-// queue. Belongs to the thread of the queue.
+// One deadline of an owner. A running deadline is in exactly one queue; the destructor removes it
+// from there. Belongs to the thread of the queue.
 class Deadline {
  public:
   explicit Deadline(DeadlineOwner& owner) : owner_(owner) {}
@@ -39,9 +39,10 @@ class Deadline {
   std::chrono::steady_clock::time_point at_;
 };
 
-// Deadlines with the same delay. The deadline that started first is therefore due first, and a
-// linked list keeps the order. Starting or stopping a deadline takes constant time, because every
-// request of every client may do both. Does not own the deadlines. Belongs to one thread.
+// The running deadlines that have the same delay. The deadline that started first is due first, and
+// a linked list is enough to keep that order. Starting or stopping a deadline takes constant time,
+// because every request of every client may do both. Does not own the deadlines. Belongs to one
+// thread.
 class DeadlineQueue {
  public:
   using Clock = std::chrono::steady_clock;
@@ -52,7 +53,7 @@ class DeadlineQueue {
 
   // Starts a deadline. Does nothing if it is running.
   void start(Deadline& deadline);
-  // When the first deadline is due; none without deadlines.
+  // Returns the time when the first deadline is due; std::nullopt if none is running.
   [[nodiscard]] std::optional<Clock::time_point> first() const;
   // Stops each due deadline and calls its owner, which may start and stop deadlines.
   void expire(Clock::time_point now);
@@ -67,17 +68,17 @@ class DeadlineQueue {
   Deadline* last_ = nullptr;
 };
 
-// The timer of a loop. It is set only while something can become due, because an idle service must
-// not wake up. Belongs to the loop's thread.
+// The timer of a loop. The timer is set only while a deadline is running, because an idle service
+// must not wake up. Belongs to the loop's thread.
 class LoopTimer final : public EventSource {
  public:
   enum class Before : std::uint8_t { kSleep, kNextTurn };
 
   // Returns false if the system gave no timer.
   [[nodiscard]] bool open(EventLoop& loop);
-  // Makes the loop wake up at `due`. A timer that is set too early stays as it is until it expires
-  // and is set again. This saves a system call for most requests. A timer that is not needed any
-  // more is disabled before the loop sleeps.
+  // Makes the loop wake up at `due`. If the timer is set to an earlier time, leaves it as it is: it
+  // expires early and is then set again. This saves a system call for most requests. If `due` is
+  // empty, disables the timer, but only before the loop sleeps.
   void arrange(std::optional<std::chrono::steady_clock::time_point> due, Before before);
   void onReady(std::uint32_t events) override;
 

@@ -2,7 +2,7 @@
 
 #include <string_view>
 
-// The standard D-Bus errors with which requests are refused.
+// The names of the standard D-Bus errors with which the adapter refuses requests.
 namespace halvox::platform::linux_::error_names {
 
 inline constexpr std::string_view kAccessDenied = "org.freedesktop.DBus.Error.AccessDenied";

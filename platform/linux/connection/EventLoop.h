@@ -16,10 +16,10 @@ class EventSource {
 };
 
 // Waits for descriptors to become ready (epoll, level-triggered). A source that does not read
-// everything is called again in the next turn, after the others: one busy client cannot starve
-// them. Idle descriptors cost nothing. Belongs to one thread. Does not own the sources. A source
-// must exist until the end of the turn in which it was removed: an event for it may already have
-// been fetched.
+// everything is called again in the next turn, after the other sources. One busy client can
+// therefore not starve the others. Idle descriptors cost nothing. Belongs to one thread. Does not
+// own the sources. A source must exist until the end of the turn in which it was removed, because
+// the loop may already have fetched an event for it.
 class EventLoop {
  public:
   enum class Wait : std::uint8_t { kBlock, kPoll };
@@ -36,7 +36,8 @@ class EventLoop {
   void change(int fd, std::uint32_t events, EventSource& source);
   void forget(int fd);
 
-  // Waits, then calls the sources that are ready, at most kEventsPerTurn. Returns their number.
+  // Waits, then calls the sources that are ready, at most kEventsPerTurn of them. Returns their
+  // number.
   std::size_t runOnce(Wait wait);
 
  private:

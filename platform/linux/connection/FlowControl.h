@@ -8,13 +8,13 @@
 
 namespace halvox::platform::linux_ {
 
-// Counts the open requests of one client, so that its reader can pause until they are carried out.
-// A flood of requests then slows down only the client that sends it, and memory stays bounded.
-// ConnectionLimits.h has the bounds.
+// Counts the open requests of one client. While too many are open, the service does not read from
+// the client. A flood of requests then slows down only the client that sends it, and memory stays
+// bounded. ConnectionLimits.h has the bounds.
 //
 //   below --open()--> full --wait()--> waiting --close() reaches half--> below, the reader is woken
 //
-// The I/O thread opens and waits; any thread closes. Owned by the client's link.
+// The I/O thread calls open() and wait(); any thread calls close(). Owned by the client's link.
 class FlowControl {
  public:
   // What one request adds to the number and the bytes of open requests.
@@ -25,11 +25,11 @@ class FlowControl {
 
   void open(Cost cost) { open_.fetch_add(packed(cost), std::memory_order_relaxed); }
 
-  // Returns true if the reader waits and has room again. The caller must then wake it. Of several
-  // callers, only one gets true.
+  // Returns true if the reader waits and at most half of the bounds is used now. The caller must
+  // then wake the reader. If several threads call close() at once, only one of them gets true.
   [[nodiscard]] bool close(Cost cost) {
-    // Sequentially consistent with wait(): the later of the two sees what the earlier one did. The
-    // reader therefore cannot sleep forever.
+    // Sequentially consistent with wait(): of a close() and a wait() at the same time, the later
+    // one sees what the earlier one did. No wake-up is lost, and the reader cannot wait forever.
     const std::uint64_t left = open_.fetch_sub(packed(cost)) - packed(cost);
     return hasRoomAgain(left) && waiting_.load() && waiting_.exchange(false);
   }
@@ -39,7 +39,8 @@ class FlowControl {
     return requestsIn(open) >= kMaxOpenRequests || bytesIn(open) >= kMaxOpenRequestBytes;
   }
 
-  // Asks for a wake-up when there is room again. Returns false if there already is room.
+  // Asks close() for a wake-up when half of the bounds is free. Returns false if half is free
+  // already.
   [[nodiscard]] bool wait() {
     waiting_.store(true);
     return !(hasRoomAgain(open_.load()) && waiting_.exchange(false));
@@ -48,8 +49,9 @@ class FlowControl {
   [[nodiscard]] std::size_t openRequests() const { return requestsIn(open_.load()); }
 
  private:
-  // Both sums are in one word, and one atomic operation changes both. The low 24 bits are the
-  // number of requests, the others are the bytes. Flow control keeps both far below their width.
+  // Both sums are in one word, because one atomic operation must change both. The low 24 bits are
+  // the number of requests, the other bits are the bytes. The bounds keep both sums far below what
+  // their bits can hold.
   static constexpr unsigned kRequestBits = 24;
 
   static std::uint64_t packed(Cost cost) {

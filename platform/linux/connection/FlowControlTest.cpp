@@ -56,7 +56,8 @@ TEST(FlowControlTest, WaitingIsRefusedWhenThereIsRoom) {
   EXPECT_FALSE(flow.wait());
 }
 
-// A wait must see an earlier last close, and a last close must see an earlier wait.
+// If the last close comes first, the wait must see it. If the wait comes first, the last close must
+// see it.
 TEST(FlowControlTest, NoWakeUpIsLostBetweenThreads) {
   for (int round = 0; round < 20'000; ++round) {
     FlowControl flow;

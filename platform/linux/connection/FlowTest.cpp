@@ -29,7 +29,7 @@ std::uint64_t unreadReplies(const ServiceUnderTest& service) {
   return service.count("replies given") - service.count("replies sent");
 }
 
-// Sends calls, reading nothing, until the service waits for the client to read.
+// Sends calls and reads nothing, until the service waits for the client to read.
 bool stopReading(RawClient& client, const ServiceUnderTest& service) {
   client.authenticate();
   std::string unsent;
@@ -43,7 +43,7 @@ bool stopReading(RawClient& client, const ServiceUnderTest& service) {
   });
 }
 
-// Lets the object answer the open calls, repeatedly, until every call has its answer.
+// Lets the object answer the open calls, again and again, until every call has its answer.
 void answerUntilAllAreRead(TestObject& object, RawClient& client) {
   const std::jthread answering([&](const std::stop_token& stop) {
     while (!stop.stop_requested()) object.answerBusy();
@@ -64,7 +64,8 @@ TEST(FlowTest, ClientIsNotReadFromWhileItHasTheMostOpenRequests) {
   const std::jthread writer([&] { client.send(manyCalls(client, "busy")); });
 
   ASSERT_TRUE(eventually([&] { return object.delivered == kMaxOpenRequests; }));
-  // Other clients continue. In all their turns, no further request of the full client is delivered.
+  // Other clients continue. During all turns of the loop that serve them, no further request of the
+  // full client is delivered.
   for (int call = 0; call < 50; ++call) ASSERT_EQ(other.call("echo", "a").text, "a");
 
   EXPECT_EQ(object.delivered, kMaxOpenRequests + 50);

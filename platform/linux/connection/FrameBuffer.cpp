@@ -10,8 +10,8 @@ namespace {
 
 constexpr std::size_t kBodyLengthOffset = 4;
 
-// The longest header of a frame over the limit. The header must fit into the scratch, because the
-// service answers the header with a refusal.
+// The longest header that a frame over the limit may have. The service reads such a header, to
+// answer it with a refusal, and the header must therefore fit into the scratch.
 constexpr std::size_t kMaxSkippableHeader = kReadBytes - 8;
 
 // The size of a header: its fixed part, the array of fields and the padding to 8 bytes.
@@ -27,7 +27,8 @@ std::size_t headerBytes(std::span<const std::byte> frame) {
 std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
   // The unused bytes are always at the end of own_. Everything before them has been used.
   if (const std::size_t wanted = bytesThatDoNotFitScratch(); wanted > 0) {
-    // Allocate twice what has arrived instead of trusting the size in the header.
+    // Add at most as many bytes as have arrived, or one read. The size in the header cannot be
+    // trusted.
     const std::size_t offset = own_.size() - view_.size();
     const std::size_t grow = std::min(wanted, std::max(view_.size(), kReadBytes));
     own_.erase(own_.begin(), own_.begin() + static_cast<std::ptrdiff_t>(offset));
@@ -38,8 +39,8 @@ std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
     return readSpan_;
   }
   const std::span<std::byte> bytes = scratch.bytes();
-  // If the last read ended inside a frame, the rest must follow it in memory: frames are decoded in
-  // place.
+  // If the last read ended inside a frame, put the beginning of the frame in front of the new
+  // bytes, because frames are decoded in place.
   if (!view_.empty()) std::memcpy(bytes.data(), view_.data(), view_.size());
   view_ = bytes.first(view_.size());
   inScratch_ = true;
@@ -48,7 +49,7 @@ std::span<std::byte> FrameBuffer::readInto(const ReadScratch& scratch) {
 }
 
 void FrameBuffer::received(std::size_t count) {
-  // Removes what readInto() added for bytes that did not arrive. Does not move the other bytes.
+  // Remove what readInto() added for bytes that did not arrive. This does not move the other bytes.
   if (!inScratch_) own_.resize(view_.size() + count);
   const std::byte* start = inScratch_ ? readSpan_.data() - view_.size() : own_.data();
   view_ = {start, view_.size() + count};
@@ -71,8 +72,8 @@ void FrameBuffer::settle() {
 
 void FrameBuffer::append(std::span<const std::byte> bytes) {
   const std::size_t usedUp = own_.size() - view_.size();
-  // Erasing moves the rest. Erasing only when at least half is used moves each byte at most once on
-  // average.
+  // Erasing moves the remaining bytes. Erase only when more than half has been used: on average
+  // each byte is then moved at most once.
   if (usedUp > own_.size() / 2) {
     own_.erase(own_.begin(), own_.begin() + static_cast<std::ptrdiff_t>(usedUp));
   }
@@ -87,8 +88,8 @@ FrameBuffer::Next FrameBuffer::next() const {
     next.state = skip_ > 0 ? State::kPartial : State::kEmpty;
     return next;
   }
-  // Use the limit of D-Bus here and not our lower one. A frame between the two limits is answered
-  // with an error and skipped, and the connection continues.
+  // Measure with the limit of D-Bus, not with our lower limit. A frame between the two limits is
+  // answered with an error and skipped, and the connection continues.
   dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);
   next.state = State::kPartial;
   if (measure.state == dbus::FrameMeasure::State::kNeedMoreBytes) return next;
@@ -120,7 +121,7 @@ FrameBuffer::Next FrameBuffer::next() const {
 
 void FrameBuffer::consume(std::size_t count) {
   const std::size_t present = std::min(count, view_.size());
-  // Most bytes of a frame over the limit have not arrived yet.
+  // When a frame over the limit is consumed, most of its bytes have not arrived yet.
   skip_ += count - present;
   view_ = view_.subspan(present);
 }

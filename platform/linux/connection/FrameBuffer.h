@@ -11,9 +11,10 @@
 
 namespace halvox::platform::linux_ {
 
-// The memory into which all connections read, one after the other. They share one because a buffer
-// for each would cost 128 KiB for each idle client, and because one buffer stays in the cache. It
-// has room for what one connection has left over and for one more read. Owned by the host.
+// The memory into which all connections read, one after the other. They share one buffer because a
+// buffer of its own would cost each idle client 128 KiB, and because one buffer stays in the
+// processor's cache. It holds the unused bytes of one connection and one more read. Owned by the
+// host.
 class ReadScratch {
  public:
   ReadScratch() : bytes_(std::make_unique_for_overwrite<std::byte[]>(kBytes)) {}
@@ -24,15 +25,15 @@ class ReadScratch {
   std::unique_ptr<std::byte[]> bytes_;
 };
 
-// What one connection has received and not yet used, cut into frames.
+// The bytes that one connection has received and not yet used, cut into frames.
 //
 //   readInto() --> read(2) --> received() --> next(), consume() ... --> settle()
 //
-// Frames are decoded in place, in the shared scratch. settle() copies what is left over to storage
-// of its own. In most turns nothing is left over. An idle connection holds no storage. A frame
-// larger than a read gets storage that grows with the bytes that have arrived, not with the size
-// that the header claims: a client cannot reserve memory by announcing a large frame. Belongs to
-// one thread. Owned by its connection.
+// Frames are decoded in place, in the shared scratch. settle() copies the unused bytes into storage
+// of this buffer; in most turns there are none. An idle connection holds no storage. A frame that
+// is larger than one read gets storage that grows with the bytes that have arrived. It does not
+// grow with the size that the header claims, because a client could otherwise reserve memory by
+// announcing a large frame. Belongs to one thread. Owned by its connection.
 class FrameBuffer {
  public:
   enum class State : std::uint8_t {
@@ -60,18 +61,20 @@ class FrameBuffer {
   // Moves the remaining bytes out of the scratch, and frees storage that is not needed any more.
   void settle();
 
-  // Adds bytes that were received elsewhere. Must not be called between readInto() and settle().
+  // Adds bytes that were not received through readInto(). Must not be called between readInto() and
+  // settle().
   void append(std::span<const std::byte> bytes);
 
   // All unused bytes, whether or not they are a frame.
   [[nodiscard]] std::span<const std::byte> unused() const { return view_; }
-  // Returns the next frame or part of one. It points into this buffer and is valid until the buffer
-  // is changed.
+  // Returns the next frame or part of a frame. The result points into this buffer and is valid
+  // until the buffer is changed.
   [[nodiscard]] Next next() const;
-  // Marks bytes as used. Those that have not arrived yet are dropped when they arrive.
+  // Marks the next `count` bytes as used. Bytes among them that have not arrived yet are dropped
+  // when they arrive.
   void consume(std::size_t count);
 
-  // The header of a kOversized frame as a frame of its own, one without a body.
+  // Returns a frame that has the header of a kOversized frame and no body.
   [[nodiscard]] static std::vector<std::byte> withoutBody(const Next& oversized);
 
  private:
@@ -80,7 +83,7 @@ class FrameBuffer {
   std::size_t maxFrameBytes_;
   std::vector<std::byte> own_;
   std::span<const std::byte> view_;  // what is unused, in own_ or in the scratch
-  std::span<std::byte> readSpan_;    // what readInto() gave
+  std::span<std::byte> readSpan_;    // what readInto() returned
   std::size_t skip_ = 0;             // bytes to drop as they arrive
   bool inScratch_ = false;
 };

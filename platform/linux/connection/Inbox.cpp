@@ -33,13 +33,14 @@ void Inbox::post(const Add& add) {
     const MutexLock lock(mutex_);
     if (closed_) return;
     add();
-    // Only the first post after the loop fell asleep pays for a system call.
+    // Only the first post after the loop fell asleep must wake the loop, which takes a system call.
     mustWake = std::exchange(sleeping_, false);
   }
   if (!mustWake) return;
   const std::uint64_t one = 1;
-  // Write after the lock is released: the loop wakes up at once and takes the lock. The write
-  // cannot fail: it happens once for each sleep, and the counter therefore never fills up.
+  // Write after the lock is released, because the loop wakes up at once and takes the lock. The
+  // write cannot fail: it happens once for each sleep, and the counter of the eventfd never fills
+  // up.
   static_cast<void>(write(event_.get(), &one, sizeof one));
 }
 
@@ -66,7 +67,8 @@ bool Inbox::isLoopThread() const {
 void Inbox::attachToThisThread() { loopThread_ = std::this_thread::get_id(); }
 
 void Inbox::close() {
-  // From now on this thread posts like any other thread, and its posts find the inbox closed.
+  // From now on isLoopThread() is false on this thread, too. The thread then posts like any other
+  // thread, and the closed inbox drops its posts.
   loopThread_ = std::thread::id();
   Mail dropped;  // destroyed after the lock is released: what it holds may post again
   const MutexLock lock(mutex_);
@@ -76,8 +78,8 @@ void Inbox::close() {
 
 bool Inbox::trySleep() {
   const MutexLock lock(mutex_);
-  // Look at the mail and set the flag in one critical section. Either this sees a post, or the post
-  // sees that it must wake the loop.
+  // Look for posts and set the flag in one critical section. Either this function sees a post, or
+  // the post sees that it must wake the loop.
   if (!mail_.isEmpty()) return false;
   sleeping_ = true;
   return true;
@@ -95,7 +97,8 @@ void Inbox::take(Mail& into) {
 
 void Inbox::onReady(std::uint32_t /*events*/) {
   std::uint64_t posts = 0;
-  // Only resets the eventfd, which is level-triggered. The mail is read at the end of the turn.
+  // Only reset the eventfd, because the loop is level-triggered. The loop calls take() later in the
+  // turn.
   static_cast<void>(read(event_.get(), &posts, sizeof posts));
 }
 

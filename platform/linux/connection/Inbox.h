@@ -23,7 +23,7 @@ struct PostedReply {
   Value value;
 };
 
-// What other threads have posted to the I/O thread.
+// Everything that other threads have posted to the I/O thread and that the thread has not read yet.
 struct Mail {
   std::vector<PostedReply> replies;
   std::vector<std::shared_ptr<ClientLink>> clientsWithRoom;
@@ -34,15 +34,16 @@ struct Mail {
   void clear();
 };
 
-// The way from any thread to the I/O thread.
+// Passes replies and notices from any thread to the I/O thread.
 //
 //   awake --trySleep()--> asleep --the first post writes to the eventfd--> awake ... --close()-->
 //   closed: drops what is posted
 //
-// While the I/O thread is awake, a post costs a lock but no system call: the thread reads its mail
-// at the end of every turn. While the thread sleeps, only the first post wakes it. Shared by the
-// service and by replies and requests, which may outlive it. The number of letters is bounded: at
-// most one reply for each open request and one notice of room for each client.
+// While the I/O thread is awake, a post costs a lock but no system call, because the thread reads
+// the inbox at the end of every turn. While the thread sleeps, only the first post wakes it. Shared
+// by the service, replies and requests. Replies and requests may outlive the service. The number of
+// posts is bounded: at most one reply for each open request, and for each client one notice that
+// its requests have been carried out.
 class Inbox final : public EventSource {
  public:
   Inbox();
@@ -60,11 +61,12 @@ class Inbox final : public EventSource {
   // Only the I/O thread may call the following functions.
   void attachToThisThread();
   void close();
-  // Announces that the loop is about to sleep. Returns false if there is mail: the loop must then
+  // Announces that the loop is about to sleep. Returns false if a post waits; the loop must then
   // not sleep.
   [[nodiscard]] bool trySleep();
   void awake();
-  // Swaps the mail with `into`, which must be empty. Swapping keeps the capacity of both sides.
+  // Moves all posts to `into`, which must be empty. The two are swapped, and both therefore keep
+  // their capacity.
   void take(Mail& into);
   void onReady(std::uint32_t events) override;
 
@@ -73,7 +75,7 @@ class Inbox final : public EventSource {
   void post(const Add& add);
 
   UniqueFd event_;
-  std::atomic<std::thread::id> loopThread_;  // relaxed: a thread only compares it with itself
+  std::atomic<std::thread::id> loopThread_;  // relaxed: a thread only compares it with its own ID
   Mutex mutex_;
   Mail mail_ HALVOX_GUARDED_BY(mutex_);
   bool sleeping_ HALVOX_GUARDED_BY(mutex_) = false;

@@ -41,7 +41,7 @@ void openInterface(std::string& xml, std::string_view name) {
 void appendStandardInterfaces(std::string& xml, bool isObject) {
   std::string_view open;
   for (const StandardMethod& method : objectMethods()) {
-    // Parents of the object have no properties, but can be pinged and introspected.
+    // A parent of the object has no properties, but answers Peer and Introspectable.
     if (method.scope == StandardScope::kObject && !isObject) continue;
     if (method.interface != open) {
       if (!open.empty()) xml += " </interface>\n";
@@ -53,8 +53,8 @@ void appendStandardInterfaces(std::string& xml, bool isObject) {
   if (!open.empty()) xml += " </interface>\n";
 }
 
-// Returns the name of the only child of `path`, a parent of the object: the next element of
-// `objectPath`.
+// `path` is a parent of the object. Returns the name of its only child, which is the next element
+// of `objectPath`.
 std::string_view childOf(std::string_view path, std::string_view objectPath) {
   const std::size_t start = path == "/" ? 1 : path.size() + 1;
   return objectPath.substr(start, objectPath.find('/', start) - start);

@@ -7,8 +7,8 @@
 
 namespace halvox::platform::linux_ {
 
-// The introspection document (XML) of the exported object or of one of its parents, generated from
-// the interface's table. `path` must be one of these.
+// Returns the introspection document (XML) of `path`, generated from the interface's table. `path`
+// must be that of the exported object or of one of its parents.
 std::string introspectionOf(const NSXPCInterface& interface, std::string_view path);
 
 }  // namespace halvox::platform::linux_

@@ -25,7 +25,7 @@ class ListeningSocket;
 // Whether SIGTERM and SIGINT end the listener's resume(), and SIGUSR1 asks for a report.
 enum class EndSignals : std::uint8_t { kHandle, kLeaveAlone };
 
-// Who may connect to the socket's file.
+// Which users may connect to the socket's file.
 struct SocketAccess {
   std::uint32_t mode = defaults::kSocketModeOfSystem;  // permission bits
   std::string group;  // the group of the file; empty: the process's own
@@ -33,15 +33,15 @@ struct SocketAccess {
 
 // How connections are served.
 struct ConnectionOptions {
-  // The path of the socket. Not used under socket activation, which passes sockets.
+  // The path of the socket. Not used if socket activation passes sockets.
   std::filesystem::path socket;
   SocketAccess socketAccess;
   // Makes the directory of the socket if its parent exists.
   bool makeSocketDirectory = false;
-  BusKind bus = BusKind::kNone;  // open() fails if it cannot be joined
-  // The bus that started the service. It is joined too, unless it is `bus`. A failure is only
-  // logged: the value is inherited from any process that a bus has started, and that bus may not be
-  // meant for the service.
+  BusKind bus = BusKind::kNone;  // open() fails if the service cannot join it
+  // The bus that started the service. The service joins this bus, too, unless it is `bus`. A
+  // failure is only logged: every process inherits this value from a process that a bus has
+  // started, and that bus may not be meant for the service.
   std::optional<StarterBus> starter;
   std::string busName = "com.tarno.halvox.reporting";
   std::chrono::milliseconds handshakeTimeout{defaults::kHandshakeTimeout};
@@ -52,10 +52,10 @@ struct ConnectionOptions {
       defaults::kMessageReporterIDs;  // the most that one request may name
   std::size_t maxFrameBytes = 32 * kMiB;
   EndSignals signals = EndSignals::kHandle;
-  // Called on the I/O thread: before the first delivery of a turn, after the last one, and after
-  // the replies of the turn have been written. Replies given on this thread during `endBatch` are
-  // among those. The functions connect the loop to the queues, about which the loop itself knows
-  // nothing.
+  // Called on the I/O thread. `beginBatch` comes before the first delivery of a turn, `endBatch`
+  // after the last delivery, and `afterReplies` after the replies of the turn have been written.
+  // Replies given on this thread during `endBatch` are replies of the turn. These functions connect
+  // the loop to the queues, which the loop itself does not know.
   std::function<void()> beginBatch;
   std::function<void()> endBatch;
   std::function<void()> afterReplies;
@@ -84,17 +84,18 @@ enum class ConnectionOpenError : std::uint8_t {
 //   made --open()--> open --the listener's resume()--> serving --requestStop() or a signal--> ended
 //
 // The thread that calls resume() is the I/O thread. It does all input and output, and calls the
-// delegate, the handlers and the requests. It never waits for a client: the replies that a client
-// does not read are bounded, and only that client's own requests wait. An idle service makes no
-// wake-ups.
+// delegate, the handlers and the methods of exported objects. It never waits for a client: if a
+// client does not read its replies, the service stops reading that client's requests. An idle
+// service makes no wake-ups.
 //
-// If a bus is lost, its senders are invalidated and the socket stays in service. At the end the
-// handlers of open connections are not called. Owned by the platform.
+// If a bus is lost, the connections of its senders are invalidated, and the socket continues to be
+// served. When the service ends, it does not call the handlers of open connections. Owned by the
+// platform.
 class LinuxConnectionService final : public ConnectionService {
  public:
-  // Construct it before the first thread starts. It blocks the signals that the loop reads, and
-  // threads inherit the mask. Sets the relief handler of `backpressure`, which must outlive it. The
-  // platform's services must be installed before open().
+  // Construct this object before the first thread starts: it blocks the signals that the loop
+  // reads, and only threads that start later inherit the mask. Sets the relief handler of
+  // `backpressure`, which must outlive it. The platform's services must be installed before open().
   LinuxConnectionService(ConnectionOptions options, Backpressure& backpressure);
   LinuxConnectionService(const LinuxConnectionService&) = delete;
   LinuxConnectionService& operator=(const LinuxConnectionService&) = delete;

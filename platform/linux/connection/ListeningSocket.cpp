@@ -49,7 +49,8 @@ bool ListeningSocket::acceptOne() {
   UniqueFd fd(accept4(fd_.get(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
   if (fd) {
     isShort_ = false;
-    // Disconnect a client without credentials, about which nothing is known.
+    // If the kernel has no credentials of a client, nothing is known about it. The client is then
+    // disconnected.
     if (const std::optional<PeerCredentials> credentials = credentialsOf(fd.get())) {
       host_.acceptPeer(std::move(fd), *credentials);
     }
@@ -59,13 +60,13 @@ bool ListeningSocket::acceptOne() {
   const bool noDescriptors =
       error == EMFILE || error == ENFILE || error == ENOBUFS || error == ENOMEM;
   if (noDescriptors) waitForDescriptors(error);
-  // Any other error, except that of an empty backlog, concerns only one connection. Try the next
-  // one.
+  // EAGAIN means that no connection waits, EINVAL and EBADF that the socket is unusable. Any other
+  // error concerns only one connection; the caller then tries the next one.
   return !noDescriptors && error != EAGAIN && error != EINVAL && error != EBADF;
 }
 
 void ListeningSocket::waitForDescriptors(int error) {
-  // The socket stays readable, and a level-triggered loop would spin.
+  // The socket stays readable, and the level-triggered loop would spin.
   host_.loop().forget(fd_.get());
   isWaiting_ = true;
   host_.acceptRetries().start(retry_);

@@ -15,9 +15,9 @@ class ConnectionHost;
 //   accepting --no descriptor is left--> paused --a connection ends, or a second passes-->
 //   accepting
 //
-// While it is paused the loop does not watch it: the socket stays readable, and a level-triggered
-// event would make the loop spin. Clients wait in the socket's backlog meanwhile. Belongs to the
-// I/O thread. Owned by the host.
+// While accepting is paused, the loop does not watch the socket: the socket stays readable, and its
+// level-triggered event would make the loop spin. New clients wait in the socket's backlog. Belongs
+// to the I/O thread. Owned by the host.
 class ListeningSocket final : public EventSource, private DeadlineOwner {
  public:
   // Does not own the host, which must outlive this.

@@ -12,8 +12,9 @@ namespace {
 
 constexpr std::size_t kSpareBuffers = 16;
 constexpr std::size_t kMaxSpareBytes = 256 * kKiB;
-// Sent bytes are removed from the front of a buffer when they are at least this many and at least
-// half of it: removing them moves the rest, which must not happen after every partial write.
+// Sent bytes are removed from the front of a buffer only if they are at least this many and at
+// least half of the buffer. Removing them moves the rest, which would be too slow after every
+// partial write.
 constexpr std::size_t kCompactBytes = 64 * kKiB;
 
 }  // namespace
@@ -26,7 +27,8 @@ std::unique_ptr<OutputBuffer> OutputBufferPool::take() {
 }
 
 void OutputBufferPool::give(std::unique_ptr<OutputBuffer> buffer) {
-  // One large answer must not stay in memory for the life of the service.
+  // Free the buffer of a large answer. Its memory would otherwise stay in use until the service
+  // ends.
   if (spare_.size() >= kSpareBuffers || buffer->bytes.capacity() > kMaxSpareBytes) return;
   buffer->bytes.clear();
   buffer->frameEnds.clear();
@@ -51,7 +53,7 @@ std::size_t OutputQueue::unsentBytes() const {
 }
 
 OutputQueue::Flush OutputQueue::flush(int fd, std::size_t& sentBytes, std::size_t& droppedFrames) {
-  // Everything may have been dropped since the flush was requested.
+  // The queue may be empty, because close() can drop the output after the flush was requested.
   if (unsentBytes() == 0) {
     clear();
     return Flush::kEmpty;
@@ -60,7 +62,8 @@ OutputQueue::Flush OutputQueue::flush(int fd, std::size_t& sentBytes, std::size_
   const ssize_t count = send(fd, buffer_->bytes.data() + buffer_->sentBytes, unsentBytes(),
                              MSG_NOSIGNAL | MSG_DONTWAIT);
   if (count < 0) {
-    // Also after EINTR: the loop tries again as soon as the socket has room.
+    // Treat EINTR like a full socket. The loop calls flush() again as soon as the socket is
+    // writable.
     if (errno == EAGAIN || errno == EINTR || errno == ENOBUFS) return Flush::kBlocked;
     droppedFrames += clear();
     return Flush::kPeerGone;
@@ -92,7 +95,7 @@ void OutputQueue::noteSent(std::size_t count) {
   buffer.bytes.erase(0, cut);
   buffer.frameEnds.erase(buffer.frameEnds.begin(),
                          buffer.frameEnds.begin() + static_cast<std::ptrdiff_t>(buffer.sentFrames));
-  // The ends are offsets from the start of the buffer, which has moved.
+  // The ends are offsets from the start of the buffer, which is `cut` bytes later now.
   for (std::size_t& end : buffer.frameEnds) end -= cut;
   buffer.sentBytes = 0;
   buffer.sentFrames = 0;

@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Bytes that wait for one socket, and where each frame in them ends.
+// The bytes that wait for one socket, and the offsets at which the frames in them end.
 struct OutputBuffer {
   std::string bytes;
   std::vector<std::size_t> frameEnds;
@@ -16,8 +16,8 @@ struct OutputBuffer {
   std::size_t sentFrames = 0;
 };
 
-// Spare buffers. They let an idle connection hold no buffer and a busy one allocate none. Belongs
-// to one thread. Owned by the host, which outlives the connections.
+// Spare buffers. With them, an idle connection need not hold a buffer, and a busy connection need
+// not allocate one. Belongs to one thread. Owned by the host, which outlives the connections.
 class OutputBufferPool {
  public:
   std::unique_ptr<OutputBuffer> take();
@@ -28,8 +28,8 @@ class OutputBufferPool {
   std::vector<std::unique_ptr<OutputBuffer>> spare_;
 };
 
-// What one connection has to send. Frames are appended and leave in order. One write sends all of
-// them: the replies of a turn cost one system call. Writing never blocks. Belongs to one thread.
+// The frames that one connection has to send, in order. One write sends all of them, and the
+// replies of a turn therefore cost one system call. Writing never blocks. Belongs to one thread.
 // Owned by its stream.
 class OutputQueue {
  public:
@@ -38,13 +38,13 @@ class OutputQueue {
   // Does not own the pool, which must outlive this.
   explicit OutputQueue(OutputBufferPool& pool) : pool_(pool) {}
 
-  // The buffer to append to. Call frameAppended() after each reply. Other bytes, such as those of
-  // the handshake, are sent too but do not count as replies.
+  // Returns the buffer to append to. Call frameAppended() after each reply. Bytes without that
+  // call, such as those of the handshake, are sent but do not count as replies.
   std::string& bytes();
   void frameAppended();
 
   [[nodiscard]] bool isEmpty() const { return buffer_ == nullptr; }
-  // The number of frames whose last byte the socket has not taken.
+  // Returns the number of frames of which the socket has not yet taken the last byte.
   [[nodiscard]] std::size_t unsentFrames() const;
   [[nodiscard]] std::size_t unsentBytes() const;
 

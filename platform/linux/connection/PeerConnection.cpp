@@ -30,18 +30,19 @@ std::string PeerConnection::description() const {
 }
 
 void PeerConnection::setReading(bool reading) {
-  // This is not the client's fault: while it is held back, it cannot finish its message.
+  // Stop the deadline of a message: while the service does not read from the client, the client
+  // cannot complete the message.
   if (!reading) deadline_.stop();
-  // The handshake continues while the delegate has not accepted the client yet.
+  // The handshake continues even while the delegate has not accepted the client yet.
   stream_.setReading(reading || handshake_ != nullptr);
 }
 
 void PeerConnection::onReadable() {
-  // Deliver the messages that wait for the next turn before reading more.
+  // Do not read more while received messages still wait to be delivered.
   if (handshake_ == nullptr && !wantsInput()) return;
   if (stream_.read() == SocketStream::Read::kEnded) {
-    // A client may send its last requests and close at once. Deliver them before the connection
-    // ends.
+    // A client may send its last requests and close the socket at once. Deliver these requests
+    // before the connection ends.
     peerClosed_ = true;
     stream_.setReading(false);
   }
@@ -83,7 +84,7 @@ void PeerConnection::onDelivered(bool begun, bool progress) {
   }
   stream_.setReading(true);
   if (handshake_ != nullptr) return;
-  // Only a whole message restarts the time: a client gains nothing by sending single bytes.
+  // Only a whole message restarts the deadline. A client that sends single bytes gains no time.
   if (progress || !begun) deadline_.stop();
   if (begun) host().messages().start(deadline_);
 }

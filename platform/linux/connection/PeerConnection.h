@@ -18,10 +18,10 @@ namespace halvox::platform::linux_ {
 //   handshake --BEGIN--> requests --the peer closes, or breaks the rules--> ended
 //       \--not complete in time--> ended      \--a frame is not complete in time--> ended
 //
-// A handshake and a frame must be complete within a timeout after they have begun: otherwise a
-// client could hold descriptors and memory forever by sending half of a message. An idle connection
-// has no deadline and no buffer. Belongs to the I/O thread. Shared by the host, the lists of its
-// turn and the delegate.
+// A handshake or frame that has begun must be complete within a timeout. Without the timeouts, a
+// client could hold a descriptor and memory forever by sending half of a message. An idle
+// connection has no deadline and no buffer. Belongs to the I/O thread. Shared by the host, the
+// lists of its turn and the delegate.
 class PeerConnection final : public ClientConnection, private StreamOwner, private DeadlineOwner {
  public:
   PeerConnection(ConnectionHost& host, std::uint64_t number, UniqueFd fd,

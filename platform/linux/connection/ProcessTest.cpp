@@ -79,7 +79,7 @@ TEST_F(ProcessTest, SocketOfAKilledServiceIsReplaced) {
   waitForSocket();
 }
 
-// The program that replaces the shell inherits the descriptor.
+// The shell replaces itself with the service, which inherits the descriptor.
 std::vector<std::string> activated(const std::vector<std::string>& command) {
   std::vector<std::string> shell = {"sh", "-c", "LISTEN_PID=$$ LISTEN_FDS=1 exec \"$0\" \"$@\""};
   shell.insert(shell.end(), command.begin(), command.end());
@@ -149,7 +149,7 @@ TEST_F(ProcessTest, ClientsWaitWithoutCostWhenDescriptorsRunOut) {
   EXPECT_EQ(isSpinning(), 0);
   EXPECT_TRUE(staysQuiet(isSpinning, std::chrono::milliseconds(500)));
 
-  // When a client leaves, a waiting one takes its place. None is refused.
+  // When a client leaves, a waiting client takes its place. No client is refused.
   for (const auto& client : clients) {
     if (client != clients.front()) {
       EXPECT_TRUE(client->receive().has_value());

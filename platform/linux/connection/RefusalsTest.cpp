@@ -25,7 +25,7 @@ std::string standardError(std::string_view name) {
   return std::string(kErrors) + std::string(name);
 }
 
-// The call with its body in big-endian order, built by hand: the method "echo" with the text "hi".
+// A call of the method "echo" with the text "hi", in big-endian order and built by hand.
 std::string bigEndianEcho() {
   const auto number = [](std::uint32_t value) {
     return std::string{static_cast<char>(value >> 24), static_cast<char>(value >> 16),

@@ -15,8 +15,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Returns the name in quotes, cut if it is long. Names from the wire have a valid form, but a path
-// can be as long as the message.
+// Returns the name in quotes, cut if it is long. The names in a header have been checked, but a
+// path can be as long as the message.
 std::string quoted(std::string_view name) {
   constexpr std::size_t kMaxShown = 255;
   std::string text = "\"";
@@ -33,7 +33,8 @@ const InterfaceMethod* findMethod(const NSXPCInterface& interface, std::string_v
 }
 
 std::size_t weightOf(const InterfaceMethod& method) {
-  // A dictionary describes one session. Only a list grows with the number of sessions.
+  // A method that answers a dictionary describes one session. Only a list grows with the number of
+  // sessions.
   const bool answersList = method.out.starts_with('a') && !method.out.starts_with("a{");
   return answersList ? kListRequestWeight : 1;
 }
@@ -45,7 +46,7 @@ bool isAnswerUnwanted(const dbus::MessageHeader& header) {
 ReplyCallback makeReply(const ClientConnection& client, const dbus::MessageHeader& header,
                         const InterfaceMethod& method) {
   if (isAnswerUnwanted(header)) {
-    // The object always calls its reply, even if D-Bus forbids sending one.
+    // The object always calls its reply, even if the client has asked for none.
     return [](const std::optional<Error>&, const Value&) {};
   }
   return [ticket = std::make_shared<ReplyTicket>(client.link(), header.serial, method.out)](
@@ -80,8 +81,8 @@ RequestDispatcher::RequestDispatcher(const ConnectionOptions& options,
 void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& frame,
                                  std::size_t frameBytes) {
   const dbus::MessageHeader& header = frame.header;
-  // The service sends no calls to clients: returns and errors from them answer nothing. D-Bus
-  // allows ignoring them.
+  // Ignore returns, errors and signals from clients, as D-Bus allows. The service sends no calls to
+  // clients, and such messages answer nothing.
   if (header.type != dbus::MessageType::kMethodCall) {
     statistics_.messagesIgnored.add();
     return;
@@ -90,8 +91,8 @@ void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& fr
   const Request request{.client = client, .frame = frame, .frameBytes = frameBytes};
   if (request.isForExportedObject()) {
     const NSXPCInterface& exported = *client.exportedInterface();
-    // D-Bus allows calls without an interface if the name of the method is unambiguous. The
-    // exported interface has precedence over the standard ones.
+    // D-Bus allows calls without an interface. If several interfaces have a method of that name,
+    // the exported interface has precedence over the standard ones.
     if (header.interface.empty() || header.interface == exported.name) {
       const InterfaceMethod* method = findMethod(exported, header.member);
       if (method != nullptr) return deliver(request, *method);
@@ -109,7 +110,7 @@ void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& m
   if (method.effect != MethodEffect::kHoldsNoMore && isOverLimits(request, method)) return;
   scratch_.addedEntries = method.addedEntries;
   if (!decode(request, method.in)) return;
-  // This is the only limit that depends on the arguments.
+  // Check this limit after decoding, because it depends on the arguments.
   if (namesTooManyReporters(request, method)) {
     arguments_.clear();
     return;
@@ -127,7 +128,7 @@ void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& m
                  .reply = makeReply(client, request.header(), method),
                  .context = {.sender = client.processIdentifier(),
                              .token = std::make_shared<OpenRequest>(client.link(), cost)}});
-  // The values of one request must not live until the next.
+  // Release the values of this request now. They must not live until the next request.
   arguments_.clear();
 }
 
@@ -150,7 +151,8 @@ bool RequestDispatcher::isForbidden(const Request& request, const InterfaceMetho
   constexpr uid_t kRoot = 0;
   const uid_t owner = geteuid();
   const uid_t user = request.client.credentials().uid;
-  // The user comes from the kernel or from the bus, never from the message. A bus may not know it.
+  // The user comes from the kernel or from the bus, never from the message. The user is unknown if
+  // the bus has not reported it.
   if (user != kUnknownUser && (user == owner || user == kRoot)) return false;
   const std::string who = user == kUnknownUser ? "an unknown user" : "uid " + std::to_string(user);
   request.client.refuse(request.header(), Refusal::kNotAllowed, error_names::kAccessDenied,
@@ -159,9 +161,9 @@ bool RequestDispatcher::isForbidden(const Request& request, const InterfaceMetho
   return true;
 }
 
-// Both bounds can be exceeded a little. A client below its bound may still send one request, whose
-// bytes are charged only at its delivery. Sessions count only once they have been made, and
-// requests that are still open can make a few more.
+// A client can exceed both bounds a little. The bytes of a request are charged only at its
+// delivery, and a client below its bound may still send one request of any size. Sessions are
+// counted only once they have been made, and requests that are still open can make a few more.
 bool RequestDispatcher::isOverLimits(const Request& request, const InterfaceMethod& method) {
   const ResourceUse use = request.client.exportedObject()->resourceUse();
   const std::uint64_t maxBytes = options_.clientHistoryMegabytes * kMiB;
@@ -218,8 +220,9 @@ void RequestDispatcher::answerStandard(const Request& request, const StandardMet
 // Returns false if the request was refused or the client has disconnected.
 bool RequestDispatcher::decode(const Request& request, std::string_view signature) {
   const dbus::MessageHeader& header = request.header();
-  // The socket is read without ancillary data, and the kernel has therefore closed the descriptors.
-  // Without them the message does not mean what its sender intended.
+  // The service reads the socket without ancillary data, and the kernel has therefore closed the
+  // descriptors. Refuse the message, because without the descriptors it is not what its sender
+  // meant.
   if (header.unixFds != 0) {
     request.client.refuse(header, Refusal::kUnsupportedValue, error_names::kInvalidArgs,
                           quoted(header.member) + ": the message has " +

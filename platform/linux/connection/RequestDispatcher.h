@@ -15,16 +15,17 @@ class ClientConnection;
 struct ConnectionOptions;
 struct ConnectionStatistics;
 
-// Decides what happens to one message: it is delivered to a method of the client's exported object,
-// answered by a standard interface, or refused with an error that says what is wrong with it.
-// Belongs to the I/O thread. Owned by the host. Does not own what it is made with, which must
-// outlive it.
+// Decides what happens to one message. The dispatcher delivers the message to a method of the
+// client's exported object, answers it through a standard interface, or refuses it with an error
+// that says what is wrong. Belongs to the I/O thread. Owned by the host. Does not own the arguments
+// of its constructor, which must outlive it.
 class RequestDispatcher {
  public:
   RequestDispatcher(const ConnectionOptions& options, ConnectionStatistics& statistics,
                     const ServiceIdentity& identity);
 
-  // `frameBytes` is the size of the message on the wire. The client may end in this call.
+  // `frameBytes` is the size of the message on the wire. The client's connection may end during
+  // this call.
   void dispatch(ClientConnection& client, const dbus::Frame& frame, std::size_t frameBytes);
 
  private:
@@ -42,7 +43,8 @@ class RequestDispatcher {
   const ConnectionOptions& options_;
   ConnectionStatistics& statistics_;
   StandardInterfaces standard_;
-  // Empty between requests. Both are kept for their capacity: decoding then allocates values only.
+  // Both are empty between requests. They are members to keep their capacity: decoding then
+  // allocates only the values.
   std::vector<Value> arguments_;
   dbus::DecodeScratch scratch_;
 };

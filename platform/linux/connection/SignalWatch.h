@@ -8,8 +8,9 @@
 
 namespace halvox::platform::linux_ {
 
-// Receives SIGTERM, SIGINT and SIGUSR1 as events of a loop (signalfd), whose handlers may call any
-// function: a real signal handler may do little more than set a flag. Belongs to the loop's thread.
+// Receives SIGTERM, SIGINT and SIGUSR1 as events of a loop (signalfd). The functions that it calls
+// may do anything, whereas a real signal handler may do little more than set a flag. Belongs to the
+// loop's thread.
 class SignalWatch final : public EventSource {
  public:
   // Blocks the three signals in this thread and in those that it starts from now on.

@@ -37,8 +37,8 @@ std::optional<sockaddr_un> addressOf(const std::filesystem::path& path) {
   return address;
 }
 
-// Removes a socket file on which no process listens. Returns an error if anything else is at the
-// path.
+// Removes a socket file on which no process listens. Returns an error if another file, or a socket
+// with a listening process, is at the path.
 Result<void, Kind> clearTheWay(const std::filesystem::path& path, const sockaddr_un& address) {
   struct stat status {};
   if (lstat(path.c_str(), &status) != 0) return {};  // bind() reports other problems
@@ -85,8 +85,8 @@ Failure<Kind> bindFailure(const std::filesystem::path& path, int error) {
 
 // Returns the ID of the group; std::nullopt if there is no group of that name.
 Result<std::optional<gid_t>> findGroup(const std::string& name) {
-  // A group with many members needs a large buffer. Give up at 16 MiB: a broken look-up could ask
-  // for more each time.
+  // A group with many members needs a large buffer. Give up at 16 MiB, because a broken look-up
+  // could ask for a larger buffer each time.
   constexpr std::size_t kLargestEntry = std::size_t{1} << 24U;
   group entry{};
   group* found = nullptr;
@@ -124,9 +124,9 @@ Result<void, Kind> giveToGroup(const std::filesystem::path& path, const std::str
                      errnoText(errno) + "; only root and members of the group may do that");
 }
 
-// bind() gives the file the permissions of the descriptor, minus the umask. At first, only the
-// owner may connect: if the file were open to other users now, their connect() could succeed as
-// soon as the socket listens.
+// bind() gives the file the permissions of the descriptor, minus the umask. At first, give access
+// only to the owner. If the file were open to another user now, a connect() that has passed the
+// check of the permissions could succeed as soon as the socket listens.
 bool closeToOthers(int fd, const SocketAccess& access) {
   constexpr std::uint32_t kOwner = 0700;
   return fchmod(fd, access.mode & kOwner) == 0;
@@ -168,7 +168,8 @@ SocketFile& SocketFile::operator=(SocketFile&& other) noexcept {
 
 void SocketFile::remove() noexcept {
   struct stat status {};
-  // Another service may have replaced the file with its own socket.
+  // Remove the file only if it is still the same one. Another service may have replaced it with its
+  // own socket.
   if (!path_.empty() && lstat(path_.c_str(), &status) == 0 && status.st_dev == device_ &&
       status.st_ino == inode_) {
     static_cast<void>(unlink(path_.c_str()));
@@ -193,7 +194,7 @@ Result<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& p
     return failure(Kind::kSystem, path, "cannot set its permissions: " + errnoText(errno));
   }
   if (bind(bound.fd.get(), generic, sizeof *address) != 0) return bindFailure(path, errno);
-  // From here on, any failure removes the file again.
+  // From here on, the destructor of `bound` removes the file after any failure.
   bound.file = SocketFile(path);
   if (auto opened = letIn(path, access); !opened) return std::move(opened).error();
   if (listen(bound.fd.get(), SOMAXCONN) != 0) {
@@ -205,16 +206,16 @@ Result<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& p
 void makeDirectoryOf(const std::filesystem::path& path, const SocketAccess& access) {
   constexpr std::uint32_t kOthers = 0077;
   const std::string directory = path.parent_path().native();
-  // A directory that exists keeps its permissions, which its owner has chosen. If the directory
-  // cannot be made, bind() reports it.
+  // If the directory exists, leave the permissions that its owner has chosen. If it cannot be made,
+  // the bind() that follows fails and the failure is reported there.
   if (mkdir(directory.c_str(), 0700) != 0) return;
   if ((access.mode & kOthers) != 0) static_cast<void>(chmod(directory.c_str(), 0755));
 }
 
 Result<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
   std::vector<UniqueFd> sockets;
-  // 1: removes the variables, so that programs which the service starts do not take the sockets for
-  // theirs.
+  // The argument 1 removes the environment variables. Programs that the service starts would
+  // otherwise take the sockets for their own.
   const int count = sd_listen_fds(1);
   for (int fd = SD_LISTEN_FDS_START; fd < SD_LISTEN_FDS_START + count; ++fd) {
     sockets.emplace_back(fd);
@@ -224,7 +225,8 @@ Result<std::vector<UniqueFd>, ConnectionOpenError> passedSockets() {
                            .message = "the passed descriptor " + std::to_string(fd) +
                                       " is not a listening Unix stream socket"};
     }
-    // systemd passes blocking sockets by default. accept() would hang at an empty backlog.
+    // systemd passes blocking sockets by default. On such a socket, accept() blocks while no client
+    // waits.
     static_cast<void>(fcntl(fd, F_SETFL, O_NONBLOCK));
   }
   if (count < 0) {

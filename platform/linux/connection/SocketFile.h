@@ -11,8 +11,8 @@
 
 namespace halvox::platform::linux_ {
 
-// The file of a socket that the service made. Removed with this object, unless another process has
-// replaced it meanwhile. Move-only.
+// The file of a socket that the service made. The destructor removes the file unless another
+// process has replaced it. Move-only.
 class SocketFile {
  public:
   SocketFile() = default;
@@ -42,12 +42,12 @@ struct BoundSocket {
 Result<BoundSocket, ConnectionOpenError> listenOn(const std::filesystem::path& path,
                                                   const SocketAccess& access = {});
 
-// Makes the directory of `path` unless it exists, open to the same users as the socket. listenOn()
-// reports a failure, because it knows whether the directory was needed.
+// Makes the directory of `path` unless it exists. The directory is open to all users if `access`
+// admits others than the owner. Reports no failure: if the directory is missing, listenOn() fails.
 void makeDirectoryOf(const std::filesystem::path& path, const SocketAccess& access);
 
-// The sockets that systemd passed at the start; empty without socket activation. Later calls return
-// none, and child processes do not inherit them.
+// Returns the sockets that systemd passed at the start; empty without socket activation. Later
+// calls return none. Child processes do not inherit the sockets.
 Result<std::vector<UniqueFd>, ConnectionOpenError> passedSockets();
 
 }  // namespace halvox::platform::linux_

@@ -60,8 +60,9 @@ TEST_F(SocketFileTest, UnknownGroupIsAnErrorAndNoFileIsLeft) {
   EXPECT_FALSE(std::filesystem::exists(socketPath()));
 }
 
-// Starts a process that tries to connect until it succeeds, and then exits with status 1, or until
-// it is killed. The process needs the rights of root, which it gives up.
+// Starts a process that tries to connect, again and again. The process exits with status 1 when it
+// succeeds; otherwise the test kills it. The process needs the rights of root at its start, to give
+// them up.
 pid_t startIntruder(const path& socket) {
   const pid_t child = fork();
   if (child != 0) return child;
@@ -142,7 +143,7 @@ TEST_F(SocketFileTest, MissingDirectoryIsAnError) {
 TEST_F(SocketFileTest, DirectoryThatCannotBeWrittenIsAnError) {
   std::filesystem::permissions(directory_.path(), std::filesystem::perms(0555));
 
-  // Runs in a process of its own, which first gives up the rights of root.
+  // Runs in a child process, which first gives up the rights of root.
   const pid_t child = fork();
   if (child == 0) {
     constexpr uid_t kNobody = 65534;

@@ -29,7 +29,7 @@ SocketStream::Read SocketStream::read() {
   const ssize_t count = ::read(fd_.get(), room.data(), room.size());
   // Store errno before received(), which may allocate and change it.
   const int error = errno;
-  // Needed even if nothing arrived: readInto() may have moved what was left over.
+  // Call received() even if nothing arrived, because readInto() may have moved the unused bytes.
   input_.received(count > 0 ? static_cast<std::size_t>(count) : 0);
   if (count > 0) {
     host_.statistics().bytesReceived.add(static_cast<std::uint64_t>(count));
@@ -46,7 +46,8 @@ void SocketStream::setReading(bool reading) {
 }
 
 void SocketStream::outputAdded() {
-  // While the socket is full, a write would fail. The loop reports when the socket has room.
+  // While the socket is full, a write would fail. The loop calls onReady() when the socket is
+  // writable.
   if (flushing_ || blocked_) return;
   flushing_ = true;
   host_.turn().flushLater(*this);
@@ -63,7 +64,7 @@ void SocketStream::flush() {
   if (dropped > 0) host_.statistics().repliesDroppedGone.add(dropped);
   const bool wasBlocked = std::exchange(blocked_, result == OutputQueue::Flush::kBlocked);
   if (wasBlocked != blocked_) updateInterest();
-  // Notify the owner after a failure too: dropping output also makes room.
+  // Notify the owner after a failure, too: dropped output no longer counts against the bounds.
   owner_.onOutputProgress();
 }
 
@@ -74,7 +75,8 @@ bool SocketStream::close() {
   }
   reading_ = false;
   blocked_ = false;
-  // Do this before closing the descriptor: another connection can get its number at once.
+  // Remove the descriptor from the loop before closing it, because another connection can get the
+  // same number at once.
   updateInterest();
   fd_.reset();
   return true;
@@ -82,7 +84,7 @@ bool SocketStream::close() {
 
 void SocketStream::onReady(std::uint32_t events) {
   if (!fd_) return;
-  // EPOLLHUP and EPOLLERR count as room: the write then fails and drops the output.
+  // Treat EPOLLHUP and EPOLLERR like EPOLLOUT. The write then fails and drops the output.
   if (blocked_ && (events & ~std::uint32_t{EPOLLIN}) != 0 && !flushing_) {
     flushing_ = true;
     host_.turn().flushLater(*this);
@@ -90,8 +92,9 @@ void SocketStream::onReady(std::uint32_t events) {
   if (reading_ && (events & ~std::uint32_t{EPOLLOUT}) != 0) owner_.onReadable();
 }
 
-// A descriptor without interest is removed from the loop. epoll reports a hang-up even for an empty
-// event mask, which would make the loop spin while flow control holds the client back.
+// A descriptor is removed from the loop while the stream waits for nothing. An empty event mask is
+// not enough: epoll reports a hang-up even then, and the loop would spin while flow control holds
+// the client back.
 void SocketStream::updateInterest() {
   const std::uint32_t wanted =
       (reading_ ? std::uint32_t{EPOLLIN} : 0U) | (blocked_ ? std::uint32_t{EPOLLOUT} : 0U);

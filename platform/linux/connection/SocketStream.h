@@ -16,37 +16,37 @@ class ConnectionHost;
 class StreamOwner {
  public:
   virtual ~StreamOwner() = default;
-  // There is something to read, or the peer has closed.
+  // There is something to read, or the peer has closed the connection.
   virtual void onReadable() = 0;
   // The output was written as far as the socket took it, or dropped because the peer is gone.
   virtual void onOutputProgress() = 0;
 };
 
-// A connected socket with its unread input and unsent output. Never blocks. The owner asks for
-// reads. Writes happen once, at the end of a turn, for everything that was added in it. Belongs to
-// the I/O thread. Owned by its connection.
+// A connected socket with its unused input and unsent output. Never blocks. The owner calls read().
+// The host calls flush() once, at the end of a turn, for everything that was added during the turn.
+// Belongs to the I/O thread. Owned by its connection.
 class SocketStream final : public EventSource {
  public:
   enum class Read : std::uint8_t { kBytes, kNothing, kEnded };
 
-  // Neither is owned; both must outlive this.
+  // Does not own `host` and `owner`, which must outlive this.
   SocketStream(UniqueFd fd, ConnectionHost& host, StreamOwner& owner);
   ~SocketStream() override { close(); }
 
   [[nodiscard]] FrameBuffer& input() { return input_; }
   [[nodiscard]] OutputQueue& output() { return output_; }
   [[nodiscard]] std::uint32_t nextSerial();
-  // Continues with the serial after the last one that was used on the socket.
+  // Sets the last serial that was used on the socket. nextSerial() continues after it.
   void skipSerials(std::uint32_t last) { lastSerial_ = last; }
 
-  // Reads once into input(). The caller must settle the input before another stream reads: all
-  // share one scratch.
+  // Reads once into input(). The caller must settle the input before another stream reads, because
+  // all streams share one scratch.
   Read read();
-  // Says whether the owner wants calls of onReadable().
+  // Sets whether the stream calls onReadable() of its owner.
   void setReading(bool reading);
-  // Call it after adding to output().
+  // The owner calls this after adding to output().
   void outputAdded();
-  // Writes. Called by the host at the end of the turn.
+  // Writes the output once. The host calls this at the end of the turn.
   void flush();
   // Closes the descriptor, and drops the output and whatever is added later. Returns false if it
   // was already closed.

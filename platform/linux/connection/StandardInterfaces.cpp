@@ -32,15 +32,16 @@ StandardAnswer unknownProperty(const StandardRequest& request) {
                        "\"; the object has none"};
 }
 
-// GLib's proxies ask for all properties when they are made. The object has none, which is a valid
-// answer.
+// A GLib proxy asks for all properties when it is made. The object has none, and an empty
+// dictionary is a valid answer.
 StandardAnswer noProperties(const StandardRequest& /*request*/) {
   return {.value = Value(Dictionary{})};
 }
 
-// Keep the methods of one interface together: the introspection opens each interface once.
+// Keep the methods of one interface together, because the introspection writes one interface
+// element for each run of methods with the same interface.
 //
-// Peer is everywhere, because D-Bus defines it for every path, whether or not an object is there.
+// The scope of Peer is every path, because D-Bus defines Peer even for paths without an object.
 constexpr std::array kObjectMethods = {
     StandardMethod{kPeer, "Ping", "", "", StandardScope::kEverywhere, ping},
     StandardMethod{kPeer, "GetMachineId", "", "s", StandardScope::kEverywhere, getMachineId},
@@ -58,7 +59,7 @@ bool isExportedObject(const ClientConnection& client, std::string_view path) {
 bool isInTree(const ClientConnection& client, std::string_view path) {
   const NSXPCInterface* exported = client.exportedInterface();
   if (exported == nullptr || client.exportedObject() == nullptr) return false;
-  // Tools find the object by asking its parents, from the root down.
+  // Tools introspect the root and then each child, until they find the object.
   return path == exported->objectPath || isParentPath(path, exported->objectPath);
 }
 
@@ -108,15 +109,15 @@ bool isParentPath(std::string_view path, std::string_view objectPath) {
 const StandardMethod* StandardInterfaces::find(const ClientConnection& client,
                                                const dbus::MessageHeader& request) const {
   const StandardMethod* method = findIn(kObjectMethods, client, request);
-  // Look in these last. On a real bus, these methods belong to the bus, and none of them is found
-  // here.
+  // Look in the methods of the bus last. A client on a real bus finds none of them here, because
+  // the bus itself answers them.
   return method != nullptr ? method : findIn(busMethods(), client, request);
 }
 
 UnknownPart StandardInterfaces::unknownPartOf(const ClientConnection& client,
                                               const dbus::MessageHeader& request) const {
-  // Checks in this order, from the method to the object: a client that names the right interface
-  // should learn that only the method is wrong.
+  // Test for an unknown method first and for an unknown object second. A client that names the
+  // right interface should learn that only the method is wrong.
   const bool isOwnInterface = isExportedObject(client, request.path) &&
                               request.interface == client.exportedInterface()->name;
   if (isOwnInterface || isInterfaceOf(kObjectMethods, client, request) ||

@@ -12,7 +12,7 @@ namespace halvox::platform::linux_ {
 
 class ClientConnection;
 
-// The identity of the service, which D-Bus clients can ask for.
+// What D-Bus clients can ask about the identity of the service.
 struct ServiceIdentity {
   std::string guidHex;     // 32 hexadecimal digits, random at each start
   std::string busName;     // the well-known name
@@ -51,26 +51,26 @@ struct StandardMethod {
   StandardAnswer (*answer)(const StandardRequest& request) = nullptr;
 };
 
-// The methods of one standard interface.
+// The methods that the adapter answers itself.
 std::span<const StandardMethod> objectMethods();  // Peer, Introspectable and Properties
 std::span<const StandardMethod> busMethods();     // what a client asks its bus for
 
 // Which part of a request names something that does not exist.
 enum class UnknownPart : std::uint8_t { kObject, kInterface, kMethod };
 
-// The interfaces of D-Bus itself, which the adapter answers on behalf of the exported object. For
-// clients on our own socket it also answers the few calls to the bus that client libraries make:
-// these libraries then work unchanged. Belongs to the I/O thread. Owned by the dispatcher. Does not
-// own the identity.
+// The interfaces of D-Bus itself, which the adapter answers on behalf of the exported object.
+// Client libraries make a few calls to the bus. For clients on our own socket, which has no bus,
+// the adapter answers these calls, too, and the libraries then work unchanged. Belongs to the I/O
+// thread. Owned by the dispatcher. Does not own the identity.
 class StandardInterfaces {
  public:
   explicit StandardInterfaces(const ServiceIdentity& identity) : identity_(identity) {}
 
-  // The standard method that a request asks for, or null.
+  // Returns the standard method that a request asks for, or null if it asks for none.
   [[nodiscard]] const StandardMethod* find(const ClientConnection& client,
                                            const dbus::MessageHeader& request) const;
-  // Which part of a request is unknown. Only for requests that neither find() nor the exported
-  // object knows.
+  // Returns the unknown part of a request. Only for requests for which neither find() nor the
+  // exported object has a method.
   [[nodiscard]] UnknownPart unknownPartOf(const ClientConnection& client,
                                           const dbus::MessageHeader& request) const;
   [[nodiscard]] const ServiceIdentity& identity() const { return identity_; }

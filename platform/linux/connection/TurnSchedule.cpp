@@ -29,7 +29,8 @@ void TurnSchedule::finishNext(std::shared_ptr<ClientConnection> client) {
   ending_.push_back(std::move(client));
 }
 
-// The batch begins lazily: a turn without deliveries, such as one that only writes, needs none.
+// Begins the batch at the first call of a turn. A turn without deliveries, such as one that only
+// writes, needs no batch.
 void TurnSchedule::beforeDelivery() {
   if (inBatch_) return;
   inBatch_ = true;
@@ -41,15 +42,15 @@ bool TurnSchedule::hasWork() const {
 }
 
 void TurnSchedule::begin() {
-  // Swap the lists: a client that becomes due in this turn must wait for the next one. Both lists
-  // keep their capacity.
+  // A client that becomes due during this turn goes into the other list and waits for the next
+  // turn. Both lists keep their capacity.
   std::swap(due_, next_);
   std::swap(ended_, ending_);
 }
 
 void TurnSchedule::deliver(std::size_t readyCount) {
-  // The clients with events in this turn have already delivered, with the share of the previous
-  // turn: their number was not known until now.
+  // The clients that had events in this turn have already delivered. They used the share of the
+  // previous turn, because the number of clients in this turn was not known before now.
   requestsPerClient_ = readyCount + due_.size() <= kFewClients ? kTurnRequests : kShortTurnRequests;
   for (const std::shared_ptr<ClientConnection>& client : due_) client->deliver();
   due_.clear();
@@ -57,7 +58,7 @@ void TurnSchedule::deliver(std::size_t readyCount) {
 
 void TurnSchedule::finishEnded() {
   for (std::shared_ptr<ClientConnection>& client : ended_) {
-    // The handlers queue clean-up jobs, which must be part of this turn's batch.
+    // The handlers add clean-up jobs to queues, and these jobs must be part of this turn's batch.
     beforeDelivery();
     client->finish();
     finished_.push_back(std::move(client));
@@ -72,17 +73,19 @@ void TurnSchedule::endDeliveries() {
 }
 
 void TurnSchedule::relieve() {
-  // Empty the list first: a client may have to wait again at once, and is then added to it.
+  // Empty the list first, because a client that must wait again is added to it.
   Clients relieved;
   std::swap(relieved, waitingForRelief_);
   for (const std::shared_ptr<ClientConnection>& client : relieved) client->onRelief();
 }
 
 void TurnSchedule::flush() {
-  // A flush can make its owner deliver or end in the next turn, but cannot add another flush.
+  // The list does not grow in this loop: after a flush, the stream's owner may deliver or end in
+  // the next turn, but requests no other flush now.
   for (SocketStream* stream : flushing_) stream->flush();
   flushing_.clear();
-  // Wake the pool last: a pool thread that is woken earlier competes with the replies for a core.
+  // Wake the pool last. A pool thread that is woken earlier competes for a core with the thread
+  // that writes the replies.
   if (std::exchange(hasReplies_, false) && afterReplies_) afterReplies_();
 }
 

@@ -11,11 +11,11 @@ namespace halvox::platform::linux_ {
 class ClientConnection;
 class SocketStream;
 
-// The lists of clients and streams that a turn of the loop works through after it has taken events.
-// Every client gets its share of deliveries, then all outputs are written. A client with more than
-// its share continues in the next turn, after those that have just become readable, which means
-// that a flood of one client delays the others by at most one share. Belongs to the I/O thread.
-// Owned by the host.
+// The lists of clients and streams that a turn of the loop works through after it has handled the
+// events. Every client gets its share of deliveries, then all outputs are written. A client with
+// more than its share continues in the next turn, after the clients that have become readable by
+// then. A flood of one client therefore delays the others by at most one share. Belongs to the I/O
+// thread. Owned by the host.
 class TurnSchedule {
  public:
   // The functions of the same names in ConnectionOptions.
@@ -27,11 +27,11 @@ class TurnSchedule {
   // Lets the client deliver after the store has caught up.
   void deliverWhenRelieved(std::shared_ptr<ClientConnection> client);
   void flushLater(SocketStream& stream);
-  // Finishes a client that has ended. Does so in the next turn, after the client's last replies
-  // were written.
+  // Finishes a client that has ended, in the next turn. The client's last replies have been written
+  // by then.
   void finishNext(std::shared_ptr<ClientConnection> client);
-  // Call before anything that can queue jobs: a delivery, a handler, an acceptance. Begins the
-  // batch.
+  // Begins the batch of this turn unless it has begun. Call this before anything that can add jobs
+  // to a queue: a delivery, a handler, or the question whether to accept a client.
   void beforeDelivery();
 
   // Returns true if the next turn must not sleep.
@@ -46,8 +46,8 @@ class TurnSchedule {
   void endDeliveries();
   void relieve();
   void flush();
-  // Releases the clients that have finished. Not earlier: events of this turn may still refer to
-  // them.
+  // Releases the clients that have finished. Call this last, because events of this turn may still
+  // refer to these clients.
   void reap() { finished_.clear(); }
   // Forgets all clients, because the loop has ended.
   void clear();
@@ -59,7 +59,7 @@ class TurnSchedule {
   std::function<void()> endBatch_;
   std::function<void()> afterReplies_;
   bool inBatch_ = false;
-  bool hasReplies_ = false;  // of a batch that were not written yet
+  bool hasReplies_ = false;  // the replies of a batch are not written yet
   std::size_t requestsPerClient_;
   Clients due_;   // deliver in this turn
   Clients next_;  // deliver in the next turn

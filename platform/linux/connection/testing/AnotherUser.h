@@ -7,9 +7,9 @@
 
 namespace halvox::platform::linux_ {
 
-// While this object exists, its thread, and no other, acts as a user who is neither root nor the
-// user of the test. Connections that it makes keep belonging to that user. Needs the rights of
-// root.
+// While this object exists, the thread that made it, and no other thread, acts as another user:
+// neither root nor the user of the test. Connections that the thread makes in that time belong to
+// that user even afterwards. Needs the rights of root.
 class AnotherUser {
  public:
   static constexpr uid_t kUid = 65534;
@@ -22,7 +22,8 @@ class AnotherUser {
   ~AnotherUser() { become(0); }
 
  private:
-  // Use the system call: the function of the C library would change all threads.
+  // Use the system call, because the function of the C library would change the user of all
+  // threads.
   static void become(uid_t user) {
     constexpr uid_t kSame = static_cast<uid_t>(-1);
     if (syscall(SYS_setresuid, kSame, user, kSame) != 0) std::abort();

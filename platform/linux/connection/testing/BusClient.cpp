@@ -8,7 +8,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The first value of an answer, as text.
+// Returns the first value of an answer as text.
 std::string firstValue(sd_bus_message* message) {
   char type = 0;
   const char* contents = nullptr;

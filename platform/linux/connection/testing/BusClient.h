@@ -23,11 +23,11 @@ class BusClient {
  public:
   enum class Kind : bool { kPeer, kBusClient };
 
-  // A bus client sends Hello first, a peer does not. Throws if it cannot connect.
+  // A client of a bus sends Hello first, a client of our own socket does not. Throws if it cannot
+  // connect.
   explicit BusClient(const std::string& address, Kind kind = Kind::kBusClient);
 
-  // Calls a method of the test's object. `types` and `arguments` are those of
-  // sd_bus_message_append(), for texts only.
+  // Calls a method of the test's object, with one text or without arguments.
   BusAnswer call(const std::string& member, const std::string& text);
   BusAnswer call(const std::string& member);
   // Calls any method without arguments or with text arguments.

@@ -23,15 +23,15 @@ struct RawAnswer {
   std::vector<Value> values;  // of the types in the message's signature
 };
 
-// A client that sends any bytes, to test what proper clients never do. Reads wait for kTestDeadline
-// at most.
+// A client that can send any bytes, to test what proper clients never send. A read waits for at
+// most kTestDeadline.
 class RawClient {
  public:
   explicit RawClient(const std::filesystem::path& socket);
 
-  // Sends the handshake in one write with what follows it.
+  // Sends the handshake and the bytes that follow it in one write.
   void authenticate(std::string_view withMore = {});
-  // Sends everything, and waits for room.
+  // Sends everything, and waits while the socket is full.
   void send(std::string_view bytes);
   // Sends what the socket takes without waiting. Returns the number of bytes.
   std::size_t trySend(std::string_view bytes);

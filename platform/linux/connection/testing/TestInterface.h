@@ -11,14 +11,16 @@
 
 namespace halvox::platform::linux_ {
 
-// The object that the tests export. Its methods show each way in which a request can be treated.
+// The object that the tests export. There is a method for each way in which a request can be
+// treated.
 class TestObject final : public ExportedObject {
  public:
   [[nodiscard]] ResourceUse resourceUse() const override {
     return {.bytes = heldBytes.load(), .sessions = sessions.load()};
   }
 
-  // Open requests to "busy" keep their tokens, those to "hold" do not.
+  // An unanswered request to "busy" stays open, because the object keeps its token. A request to
+  // "hold" is carried out at once and answered later.
   void keepBusy(RequestToken token, ReplyCallback reply);
   void holdReply(ReplyCallback reply);
   void answerBusy();

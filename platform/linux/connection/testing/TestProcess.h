@@ -19,7 +19,7 @@ class TestProcess {
     int passedFd = -1;                       // what the child gets as descriptor 3
   };
 
-  // Throws when the program cannot be started. Its standard output can be read by firstLine().
+  // Throws if the program cannot be started. firstLine() reads the program's standard output.
   TestProcess(const std::vector<std::string>& command, const Options& options);
   explicit TestProcess(const std::vector<std::string>& command) : TestProcess(command, Options()) {}
   TestProcess(const TestProcess&) = delete;
@@ -30,12 +30,12 @@ class TestProcess {
   void signal(int number) const { child_->signal(number); }
   // Returns the first line that the child prints.
   std::string firstLine();
-  // Waits for its end and returns its exit status; std::nullopt if a signal ended it or it does not
-  // end in time.
+  // Waits for the end of the program and returns its exit status; std::nullopt if a signal ended
+  // the program or it does not end in time.
   std::optional<int> waitForExit();
-  // A number from a line of /proc/<pid>/status.
+  // Returns the number in a line of /proc/<pid>/status.
   [[nodiscard]] long statusNumber(const std::string& name) const;
-  // The processor time that it has used, in seconds.
+  // Returns the processor time that the program has used, in seconds.
   [[nodiscard]] double processorSeconds() const;
 
  private:

@@ -11,7 +11,7 @@
 #include "platform/linux/connection/wire/ValueDecoder.h"
 #include "platform/linux/connection/wire/testdata/TestFrames.h"
 
-// The content of the decoder's caches must not change what it returns.
+// The content of the decoder's caches must not change the result of decoding.
 namespace halvox::platform::linux_::dbus {
 namespace {
 
@@ -29,7 +29,7 @@ std::string messageBody(const WireBytes& entries, std::uint64_t reporter, bool b
   body.array(8, entries.bytes()).u32(4).u16(18);
   WireBytes numbers(bigEndian);
   numbers.u64(reporter);
-  // The list of lists: one list of one number. Written by hand, because the padding of the inner
+  // A list that contains one list of one number. Written by hand, because the padding of the inner
   // list depends on its place in the message.
   body.align(4);
   const std::size_t lists = body.bytes().size() + 4;
@@ -143,7 +143,7 @@ TEST_F(DecodeCachesTest, InnerDictionariesMayHaveTheKeysOfTheOuterOne) {
   entry(inner, "a", "u").u32(2);
   WireBytes outer;
   entry(outer, "a", "u").u32(1);
-  // At offset 24, where an inner array of dictionaries needs no padding of its own.
+  // Begin at offset 24, where an inner array of dictionaries needs no padding of its own.
   entry(outer, "c", "a{sv}").align(4);
   outer.u32(static_cast<std::uint32_t>(inner.bytes().size())).align(8).raw(inner.bytes());
   entry(outer, "a", "u").u32(3);

@@ -8,8 +8,8 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// Long enough to recognise a key. A path has up to 64 keys, and the whole path is part of one log
-// line.
+// How much of a key a path shows: enough to recognise the key. A path has up to 64 keys, and the
+// whole path is part of one log line.
 constexpr std::size_t kMaxQuotedBytes = 64;
 
 void appendEscaped(std::string& out, char byte) {

@@ -10,17 +10,17 @@ namespace halvox::platform::linux_::dbus {
 // everything else is escaped, and long texts are cut. The result is always valid UTF-8.
 [[nodiscard]] std::string quotable(std::string_view text);
 
-// A place in the arguments of a message, such as `argument 1, key "a"."b"[3]`.
-// Built from the inside out while the decoder leaves its containers because of an error. Decoding
-// without an error therefore pays nothing for it.
+// A place in the arguments of a message, such as `argument 1, key "a"."b"[3]`. After an error, each
+// container adds its step in front while the decoder leaves it, from the innermost to the
+// outermost. Decoding without an error therefore costs nothing extra.
 class DecodePath {
  public:
   void putBefore(std::string_view key);
   void putBefore(std::size_t element);
-  // The number of the argument, counted from 1.
+  // Sets the number of the argument, counted from 1.
   void setArgument(std::size_t number) { argument_ = number; }
 
-  // Empty if not even the argument is known.
+  // Returns the path as text; empty if not even the argument is known.
   [[nodiscard]] std::string text() const;
 
  private:

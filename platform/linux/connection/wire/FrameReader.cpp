@@ -16,7 +16,7 @@ struct FieldRule {
   std::string_view name;
   char type;
 };
-// The fields that D-Bus defines. The index is the number of the field; 0 is invalid.
+// The fields that D-Bus defines. The index of a rule is the number of the field; 0 is invalid.
 constexpr std::array<FieldRule, 10> kFieldRules{{{"", '\0'},
                                                  {"path", 'o'},
                                                  {"interface", 's'},
@@ -30,7 +30,7 @@ constexpr std::array<FieldRule, 10> kFieldRules{{{"", '\0'},
 
 constexpr unsigned fieldBit(HeaderField field) { return 1U << static_cast<unsigned>(field); }
 
-// D-Bus reserves these for use inside one process. They must not be sent.
+// D-Bus reserves this path and this interface for use inside one process. They must not be sent.
 constexpr std::string_view kLocalPath = "/org/freedesktop/DBus/Local";
 constexpr std::string_view kLocalInterface = "org.freedesktop.DBus.Local";
 
@@ -45,7 +45,8 @@ std::uint32_t numberAt(std::span<const std::byte> bytes, std::size_t offset, boo
   return number;
 }
 
-// Describes what is wrong with the first bytes of a frame, and where; empty if they are valid.
+// Returns what is wrong with the first bytes of a frame, and sets `offset` to the place of the
+// error. Returns an empty text if the bytes are valid.
 std::string_view problemOfStart(std::span<const std::byte> bytes, std::size_t& offset) {
   offset = 0;
   if (!bytes.empty() && byteAt(bytes, 0) != 'l' && byteAt(bytes, 0) != 'B') {
@@ -74,7 +75,7 @@ class FieldReader {
   FieldReader(std::span<const std::byte> fields, bool bigEndian, MessageHeader& header)
       : reader_(fields, bigEndian), header_(header) {}
 
-  // Returns false on an error. error() then describes it.
+  // Returns false on an error. error() then returns the error.
   bool readAll() {
     while (!reader_.atLimit()) {
       if (!readField()) return false;
@@ -99,22 +100,22 @@ class FieldReader {
       return false;
     }
     if (code_ == 0) return reader_.fail("a field cannot have the number 0");
-    // D-Bus may define more fields. It requires that readers ignore those that they do not know.
+    // D-Bus may define more fields, and requires that readers ignore fields that they do not know.
     if (code_ >= kFieldRules.size()) return skipUnknown(type);
     if (type.size() != 1 || type.front() != kFieldRules[code_].type) {
       return reader_.fail("its type is not the one that D-Bus defines");
     }
     const unsigned bit = 1U << code_;
-    // If a field could occur twice, a bus could check its policy with the first path while the
-    // service acts on the second.
+    // Refuse a field that occurs twice. If a message had two paths, a bus could check its policy
+    // with the first one while the service acts on the second.
     if ((seen_ & bit) != 0) return reader_.fail("occurs twice");
     seen_ |= bit;
     return readKnown(static_cast<HeaderField>(code_));
   }
 
   bool skipUnknown(std::string_view type) {
-    // A field with an unsupported type is skipped like any other. A field with an invalid type has
-    // no known length: the next field could not be found.
+    // A field with an unsupported type is skipped like any other field. A field with an invalid
+    // type cannot be skipped, because its length is not known.
     const SignatureShape shape = shapeOfType(type);
     if (shape == SignatureShape::kBroken || shape == SignatureShape::kTooDeep) {
       return reader_.fail("its signature is invalid");
@@ -146,14 +147,14 @@ class FieldReader {
       case HeaderField::kSignature:
         return reader_.readSignature(header_.signature);
       case HeaderField::kUnixFds:
-        // Only store the number here: the dispatcher refuses requests that have descriptors.
+        // Only store the number here. The dispatcher refuses requests that have descriptors.
         return reader_.read(header_.unixFds);
     }
     return false;
   }
 
-  // The rules of names allow only ASCII characters. A check for UTF-8 is not needed, and would read
-  // every name twice.
+  // Does not check for UTF-8, because isValid() allows only ASCII characters. The check would read
+  // every name a second time.
   bool readName(std::string_view& name, bool (*isValid)(std::string_view)) {
     return reader_.readUncheckedText(name) && (isValid(name) || reader_.fail("invalid name"));
   }
@@ -177,7 +178,7 @@ class FieldReader {
         return fieldBit(HeaderField::kPath) | fieldBit(HeaderField::kInterface) |
                fieldBit(HeaderField::kMember);
     }
-    // The fields do not matter, because the dispatcher ignores such messages.
+    // A message of an unknown type needs no fields, because the dispatcher ignores it.
     return 0;  // an unknown type
   }
 
@@ -203,7 +204,7 @@ std::variant<Frame, WireError> finish(MessageHeader header, std::span<const std:
   return Frame{header, body};
 }
 
-// Takes the fields from the cache if it is not null and has them. Otherwise reads them.
+// Takes the fields from the cache if there is a cache and it has them. Otherwise reads the fields.
 std::optional<WireError> readFields(std::span<const std::byte> fields, MessageHeader& header,
                                     HeaderCache* cache) {
   if (cache != nullptr) {
@@ -233,7 +234,8 @@ std::variant<Frame, WireError> readWhole(std::span<const std::byte> frame, Heade
   header.flags = byteAt(frame, kFlagsOffset);
   header.bigEndian = byteAt(frame, 0) == 'B';
   header.serial = numberAt(frame, kSerialOffset, header.bigEndian);
-  // D-Bus forbids it: in a reply, 0 would mean that the field is absent.
+  // D-Bus forbids the serial 0. A reply to it would have the reply serial 0, which means that the
+  // field is absent.
   if (header.serial == 0) return WireError{"the serial number must not be 0", kSerialOffset};
 
   const std::size_t fieldsBytes = numberAt(frame, kFieldsLengthOffset, header.bigEndian);
@@ -247,21 +249,22 @@ std::variant<Frame, WireError> readWhole(std::span<const std::byte> frame, Heade
 FrameMeasure measureFrame(std::span<const std::byte> bytes, std::size_t maxFrameBytes) {
   std::size_t offset = 0;
   const std::string_view problem = problemOfStart(bytes, offset);
-  // Checks each of the first bytes as soon as it has arrived: a broken stream then ends at once,
-  // not after the time limit of a message.
+  // Check the first bytes even if the rest of the header is missing. A broken stream then ends at
+  // once, not after the time limit of a message.
   if (!problem.empty()) return broken(std::string(problem), offset);
   if (bytes.size() < kFrameStartBytes) return {};
 
   const bool bigEndian = byteAt(bytes, 0) == 'B';
-  // In 64 bits, because the sum of two lengths of 32 bits must not wrap to a small frame.
+  // Add the lengths in 64 bits. In 32 bits the sum of two lengths could wrap around and look like
+  // the size of a small frame.
   const std::uint64_t bodyBytes = numberAt(bytes, kBodyLengthOffset, bigEndian);
   const std::uint64_t fieldsBytes = numberAt(bytes, kFieldsLengthOffset, bigEndian);
   if (fieldsBytes > kMaxArrayBytes) {
     return broken("the header claims more than 64 MiB of fields", kFieldsLengthOffset);
   }
   const std::uint64_t total = roundedUp(kFrameStartBytes + fieldsBytes) + bodyBytes;
-  // Checked separately from the caller's limit below: the error must name the limit that was
-  // exceeded.
+  // Check this limit separately from the caller's limit, because the error must name the limit that
+  // was exceeded.
   if (total > kMaxMessageBytes) {
     return broken("the header claims a message of " + std::to_string(total) +
                       " bytes; the limit of D-Bus is " + std::to_string(kMaxMessageBytes),
@@ -297,7 +300,8 @@ void HeaderCache::note(const MessageHeader& header, std::span<const std::byte> f
   Slot& slot = slots_[indexOf(fields)];
   slot.fields.assign(reinterpret_cast<const char*>(fields.data()), fields.size());
   slot.header = header;
-  // The caller has read these fields without an error. Read them again at their new place.
+  // The texts in `header` point into the caller's bytes. Read the fields again from the copy in the
+  // slot; this cannot fail, because the caller has read the same bytes without an error.
   MessageHeader& moved = slot.header;
   static_cast<void>(
       FieldReader(std::as_bytes(std::span(slot.fields)), header.bigEndian, moved).readAll());

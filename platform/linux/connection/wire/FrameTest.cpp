@@ -195,8 +195,8 @@ TEST(FrameTest, UnknownFieldThatNestsPastTheLimitIsRefused) {
 
 TEST(FrameTest, PaddingThatIsNotZeroIsRefused) {
   const std::string sound = frameOf(1, callFields(""), "");
-  // The first field is a path of two characters, whose NUL is followed by one byte of padding; the
-  // second ends two bytes after the last boundary.
+  // The first field is a path of two characters; one byte of padding follows its NUL. The second
+  // field ends two bytes after a multiple of 8.
   std::string betweenFields = sound;
   betweenFields[16 + 11] = 'x';
   std::string afterFields = sound;

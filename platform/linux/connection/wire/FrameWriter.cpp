@@ -10,8 +10,8 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// Appends one frame: its header field by field, then the body. Removes everything again unless
-// finish() succeeds. The caller owns the buffer, which must outlive this.
+// Appends one frame: its header field by field, then the body. Unless finish() succeeds, the
+// destructor removes everything again. The caller owns the buffer, which must outlive this.
 class FrameBuilder {
  public:
   FrameBuilder(std::string& out, MessageType type, std::uint8_t flags, std::uint32_t serial)
@@ -46,19 +46,20 @@ class FrameBuilder {
 
   // Adds the last field, ends the header and appends the body.
   bool finish(std::string_view signature, std::span<const Value> values) {
-    // Without this field, D-Bus assumes an empty body.
+    // An empty body needs no signature: without this field, D-Bus assumes an empty body.
     if (!signature.empty()) {
       beginField(HeaderField::kSignature, "g");
       encoder_.appendSignature(signature);
     }
-    // Compute this before the padding, which belongs to neither length.
+    // Compute the length of the fields before the padding is appended. The padding belongs neither
+    // to the fields nor to the body.
     encoder_.replaceLength(start_ + kFieldsLengthOffset, out_.size() - start_ - kFrameStartBytes);
     encoder_.align(8);
     const std::size_t bodyStart = out_.size();
     if (!encoder_.appendAll(signature, values)) return false;
     encoder_.replaceLength(start_ + kBodyLengthOffset, out_.size() - bodyStart);
-    // If a length did not fit into 32 bits, it has just been truncated. The frame is then over the
-    // limit and is removed.
+    // replaceLength() truncates a length that does not fit into 32 bits. Such a frame is over this
+    // limit and is removed again.
     finished_ = out_.size() - start_ <= kMaxMessageBytes;
     return finished_;
   }
@@ -87,9 +88,9 @@ bool isValid(const CallTarget& target, std::uint32_t serial) {
          isObjectPath(target.path) && isMemberName(target.member);
 }
 
-// Nearly all replies have no value or a boolean, and go to a client without a bus name. Their
-// frames differ in only three numbers. They are therefore copied from a constant, in which the
-// zeros of the serials and of the value are then replaced.
+// Nearly all replies have no value or a boolean, and go to a client without a bus name. The frames
+// of such replies differ in at most three numbers: two serials and the value. Each is therefore a
+// copy of a constant, in which these numbers are then replaced.
 constexpr std::string_view kPlainReply(
     "l\2\1\1"    // kMethodReturn, kNoReplyExpected, kProtocolVersion
     "\0\0\0\0"   // no body
@@ -131,7 +132,7 @@ void appendBooleanReply(std::string& out, std::uint32_t replySerial, std::uint32
 
 bool appendMethodReturn(std::string& out, const ReplyTo& replyTo, std::uint32_t serial,
                         std::string_view signature, const Value& value) {
-  // Check before anything is appended: on an error, `out` must stay unchanged.
+  // Check the arguments before appending anything, because after an error `out` must be unchanged.
   if (!isValid(replyTo, serial)) return false;
   if (replyTo.destination.empty() && signature.empty()) {
     appendPlainReply(out, replyTo.serial, serial);

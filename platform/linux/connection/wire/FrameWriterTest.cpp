@@ -82,8 +82,8 @@ TEST(FrameWriterTest, ReplyOverABusNamesItsDestination) {
 }
 
 TEST(FrameWriterTest, ShortFormsOfFrequentRepliesAreTheGeneralOnes) {
-  // For a bus, the frame is written in the general way. Without the destination, it must be the
-  // same frame.
+  // A frame for a client on a bus is built field by field, other frames are copied from a constant.
+  // Both must be equal except for the destination.
   const auto withoutDestination = [](std::string_view signature, const WireBytes& body) {
     WireBytes fields;
     fields.u8(5).signature("u").u32(7);

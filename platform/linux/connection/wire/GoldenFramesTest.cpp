@@ -40,7 +40,7 @@ Array oneToFiveCounted() {
   return {Array{std::int64_t{1}}, Array{}, Array{std::int64_t{2}, std::int64_t{3}}};
 }
 
-// The expected values of the cases without containers.
+// Returns the expected values of the cases without containers.
 std::map<std::string_view, Values> expectedBasics() {
   const double infinity = std::numeric_limits<double>::infinity();
   return {

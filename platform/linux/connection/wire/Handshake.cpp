@@ -14,7 +14,7 @@ struct Command {
   std::string_view arguments;
 };
 
-// The first word of a line, and what follows the blank after it.
+// Returns the first word of a line, and what follows the first blank.
 Command split(std::string_view line) {
   const std::size_t blank = line.find(' ');
   if (blank == std::string_view::npos) return {line, {}};
@@ -59,8 +59,8 @@ bool HandshakeLine::take(std::span<const std::byte>& input) {
   if (complete_) line_.clear();
   complete_ = false;
   std::size_t taken = 0;
-  // Takes nothing after the end of the line: what follows BEGIN is the first message, often in the
-  // same read.
+  // Take nothing after the end of the line. After the line BEGIN comes the first message, often in
+  // the same read.
   while (!complete_ && taken < input.size() && !isTooLong()) {
     line_ += std::to_integer<char>(input[taken++]);
     complete_ = !isTooLong() && line_.ends_with(kLineEnd);
@@ -83,8 +83,8 @@ ServerHandshake::ServerHandshake(std::string guidHex, uid_t peerUid)
 HandshakeProgress ServerHandshake::feed(std::span<const std::byte> input, std::string& output) {
   std::span<const std::byte> rest = input;
   if (step_ == Step::kNul && !rest.empty()) {
-    // D-Bus requires this byte. On some systems it carries the credentials; here the kernel
-    // provides them.
+    // D-Bus requires this byte. Some systems send the credentials with it; on Linux the kernel
+    // provides them without it.
     if (rest.front() != std::byte{0}) fail("the first byte is not NUL");
     if (step_ == Step::kNul) step_ = Step::kAuth;
     rest = rest.subspan(1);
@@ -105,14 +105,14 @@ bool ServerHandshake::isOver() const { return step_ == Step::kDone || step_ == S
 void ServerHandshake::onLine(std::string_view line, std::string& output) {
   const auto [command, arguments] = split(line);
   if (!isPrintableAscii(line)) {
-    // Never echoes the line: it may contain anything.
+    // Do not quote the line in the answer, because it may contain anything.
     refuse("not printable ASCII", output);
   } else if (command == "BEGIN") {
     if (step_ == Step::kBegin) {
       step_ = Step::kDone;
     } else {
-      // Do not answer ERROR: the client may already be sending messages, and D-Bus requires a
-      // disconnect.
+      // Do not answer with ERROR. The client may already be sending messages, and D-Bus requires
+      // that the server disconnects.
       fail("BEGIN before the authentication");
     }
   } else if (command == "AUTH" && step_ == Step::kAuth) {
@@ -122,7 +122,8 @@ void ServerHandshake::onLine(std::string_view line, std::string& output) {
   } else if (command == "CANCEL" || command == "ERROR") {
     onCancel(command, output);
   } else if (command == "NEGOTIATE_UNIX_FD" && step_ == Step::kBegin) {
-    // Clients continue without descriptors. The service accepts none and therefore cannot leak any.
+    // After this answer, clients continue without passing descriptors. A service that accepts no
+    // descriptors cannot leak any.
     output += "ERROR file descriptors are not taken\r\n";
     countRefusal();
   } else {
@@ -134,8 +135,8 @@ void ServerHandshake::onAuth(std::string_view arguments, std::string& output) {
   const auto [mechanism, response] = split(arguments);
   if (mechanism == "ANONYMOUS") {
     if (isHex(response)) {
-      // The kernel provides the client's identity, which the handshake cannot change. Anonymous
-      // clients need not be refused.
+      // Accept anonymous clients. The kernel provides the client's identity in any case, and the
+      // handshake cannot change it.
       accept(output);  // ignores the trace that the client sends
     } else {
       reject(output);
@@ -152,8 +153,8 @@ void ServerHandshake::onAuth(std::string_view arguments, std::string& output) {
 }
 
 void ServerHandshake::onIdentity(std::string_view hex, std::string& output) {
-  // An empty identity stands for the one that the kernel provides. Any other must be equal to that
-  // one.
+  // An empty identity stands for the identity that the kernel provides. Any other must be equal to
+  // the kernel's.
   if (hex.empty() || (isHex(hex) && fromHex(hex) == peerUid_)) {
     accept(output);
   } else {

@@ -8,7 +8,7 @@
 
 #include <sys/types.h>
 
-// The authentication before the first message, for either side. It does no input or output itself:
+// The authentication before the first message, for both sides. These classes do no input or output:
 // the owner of the socket passes in what it has read, and sends the output that it gets back.
 namespace halvox::platform::linux_::dbus {
 
@@ -21,14 +21,16 @@ enum class HandshakeState : std::uint8_t {
 // The result of one step of a handshake.
 struct HandshakeProgress {
   HandshakeState state = HandshakeState::kContinue;
-  // How much of the input belonged to the handshake: all of it, unless the handshake is done.
+  // How many bytes of the input belonged to the handshake: all of them, unless the handshake is
+  // over.
   std::size_t consumedBytes = 0;
   // Why it failed: one line of printable ASCII.
   std::string error;
 };
 
-// A handshake fails at a line longer than kMaxHandshakeLine, and after kMaxRefusedLines refused
-// lines: a client that does not know the protocol must not keep the service busy.
+// A handshake fails if a line is longer than kMaxHandshakeLine, or if more than kMaxRefusedLines
+// lines were refused. Without these limits, a client that does not know the protocol could keep the
+// service busy.
 inline constexpr std::size_t kMaxHandshakeLine = std::size_t{16} * 1024;
 inline constexpr unsigned kMaxRefusedLines = 16;
 
@@ -47,23 +49,24 @@ class HandshakeLine {
   bool complete_ = false;
 };
 
-// The service's side. The identity of the peer comes from the credentials of the socket
-// (`peerUid`). A client may omit its identity; if it claims one, it must be that one.
+// The service's side of the handshake. The identity of the peer comes from the credentials of the
+// socket (`peerUid`). A client may omit its identity. If it claims one, the identity must be equal
+// to `peerUid`.
 //
 //   NUL ──► auth ──AUTH──► begin ──BEGIN──► done
 //            │▲  AUTH without an identity: data ──DATA──► begin
 //            └┘  anything that is refused
 //
-// Offers EXTERNAL and ANONYMOUS. ANONYMOUS is as safe, because the peer's identity comes from the
-// kernel and not from the handshake. Does not agree to pass file descriptors. Belongs to the thread
-// of the connection, which owns it until the handshake is done.
+// Offers EXTERNAL and ANONYMOUS. ANONYMOUS is as safe as EXTERNAL, because the peer's identity
+// comes from the kernel and not from the handshake. Does not agree to pass file descriptors.
+// Belongs to the thread of the connection, which owns it until the handshake is done.
 class ServerHandshake {
  public:
   // `guidHex` is the identity of the service, 32 hexadecimal digits.
   ServerHandshake(std::string guidHex, uid_t peerUid);
 
-  // Takes input in pieces of any size, and appends the answers to `output`. Takes nothing more
-  // after the handshake is done or has failed.
+  // Takes input in pieces of any size, and appends the answers to `output`. Takes no input after
+  // the handshake is done or has failed.
   HandshakeProgress feed(std::span<const std::byte> input, std::string& output);
 
  private:
@@ -88,8 +91,8 @@ class ServerHandshake {
   std::string error_;
 };
 
-// The side of a client that connects to a bus as this user. Belongs to one thread and is owned by
-// the connector.
+// The client's side of the handshake, for a client that connects to a bus as the user `uid`.
+// Belongs to one thread. Owned by the BusConnector.
 //
 //   start() ──► waiting for OK ──► done, or failed at any other line
 class ClientHandshake {

@@ -6,7 +6,8 @@ namespace halvox::platform::linux_::dbus {
 namespace {
 
 constexpr std::size_t kLengthBytes = 4;
-// After the text: a NUL, the length of the signature, its one character and another NUL.
+// The bytes of a head after the key's text: a NUL, the length of the signature, its one character
+// and another NUL.
 constexpr std::size_t kTailBytes = 4;
 constexpr std::string_view kBasicTypes = "ynqiuxtdbsog";
 
@@ -17,7 +18,7 @@ Word wordAt(const char* bytes) {
   return word;
 }
 
-// Mixes the first and the last characters. Keys often differ in the last one only.
+// Hashes the first and the last characters, because keys often differ only in the last one.
 std::uint64_t mixed(std::string_view text) {
   constexpr std::uint64_t kFactor = 0x9e3779b97f4a7c15U;
   const char* const begin = text.data();
@@ -49,7 +50,8 @@ KeyCache::Head KeyCache::find(std::string_view bytes) {
   if (length > bytes.size() - kLengthBytes - kTailBytes) return {};
   const std::string_view text = bytes.substr(kLengthBytes, length);
   Slot& slot = slotOf(text);
-  // Bytes that are not valid can look like a free slot: an empty text and zeros.
+  // Test for a free slot first. Invalid bytes, an empty text and zeros, can be equal to the content
+  // of a free slot.
   if (!slot.key.has_value()) return {};
   if (wordAt<std::uint32_t>(text.data() + length) != slot.tail || text != slot.text) return {};
   const bool isRepeated = slot.dictionary == dictionary_;

@@ -12,29 +12,31 @@ namespace halvox::platform::linux_::dbus {
 
 // The recent keys of entries of a{sv} dictionaries, each with the type of its last value.
 //
-// Messages of a client have the same keys again and again. An entry whose first bytes are known
-// needs no check of its text, no look-up in the table of interned keys and no check of its
-// variant's signature: these are half of the work for a message without the cache.
+// Messages of a client have the same keys again and again. If the cache knows the first bytes of an
+// entry, the decoder need not check the key's text, look the key up in the table of interned keys
+// or check the variant's signature. Without the cache, these steps are half of the work for a
+// message.
 //
-// A key has one slot, which depends on its text only. The cache can therefore tell whether a
-// dictionary has a key twice. Keeps interned keys only, because they live as long as the process.
-// Belongs to one thread. Owned by the caller of the decoder.
+// A key can be in only one slot, which its text chooses. The slot remembers the last dictionary
+// that had the key, and thereby shows whether a dictionary has the key twice. The cache stores only
+// interned keys, because their texts live as long as the process. Belongs to one thread. Owned by
+// the caller of the decoder.
 class KeyCache {
  public:
-  // The front of an entry: the key and the signature of its value.
+  // The head of an entry: its first bytes, with the key and the signature of the value.
   struct Head {
     const Key* key = nullptr;  // null if the head is not known
-    std::size_t bytes = 0;     // its length on the wire; the last but one is the type
+    std::size_t bytes = 0;     // the head's length; its last byte but one is the type
     bool isRepeated = false;   // the dictionary had this key before
   };
 
-  // Begins a dictionary. Only one can be decoded at a time.
+  // Begins a dictionary. Only one dictionary at a time can use the cache.
   void beginDictionary() { ++dictionary_; }
-  // Looks for the head at the front of `bytes`, which are in the byte order of this machine and
-  // begin at a multiple of 8 bytes of the message.
+  // Looks for the head at the start of `bytes`. The bytes must be in the byte order of this machine
+  // and begin at a multiple of 8 in the message.
   [[nodiscard]] Head find(std::string_view bytes);
-  // Keeps the head at the front of `bytes`, which was decoded without an error to `key`. Ignores it
-  // unless the key is interned and the value has a type of one character.
+  // Stores the head at the start of `bytes`, from which `key` was decoded without an error. Ignores
+  // the head unless the key is interned and the type of the value is a basic one.
   void note(std::string_view bytes, const Key& key);
 
  private:
@@ -45,7 +47,7 @@ class KeyCache {
     std::uint32_t dictionary = 0;  // the last one that had the key
   };
 
-  // More than a busy client's vocabulary; 12 KiB.
+  // More slots than a busy client has keys. The slots take 12 KiB.
   static constexpr std::size_t kSlots = 256;
 
   [[nodiscard]] Slot& slotOf(std::string_view text);

@@ -6,7 +6,7 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// The classes of characters in names, one bit each: a character is checked with one look-up.
+// The classes of characters in names. Each class is one bit, and one look-up checks a character.
 constexpr std::uint8_t kLetter = 1;  // the underscore counts as one
 constexpr std::uint8_t kDigit = 2;
 constexpr std::uint8_t kHyphen = 4;
@@ -28,7 +28,7 @@ struct ElementRules {
   std::uint8_t rest;   // classes of its other characters
 };
 
-// The number of elements of `text`; 0 if one of them breaks the rules.
+// Returns the number of elements of `text`; 0 if an element breaks the rules.
 std::size_t countElements(std::string_view text, const ElementRules& rules) {
   std::size_t elements = 1;
   bool atStart = true;
@@ -50,13 +50,13 @@ constexpr std::uint8_t kWord = kLetter | kDigit;
 constexpr ElementRules kPathRules{'/', kWord, kWord};
 constexpr ElementRules kInterfaceRules{'.', kLetter, kWord};
 constexpr ElementRules kWellKnownRules{'.', kLetter | kHyphen, kWord | kHyphen};
-// In names that a bus gives, elements may start with a digit, as in `:1.42`.
+// In the unique names that a bus assigns, elements may start with a digit, as in `:1.42`.
 constexpr ElementRules kUniqueRules{'.', kWord | kHyphen, kWord | kHyphen};
 
 }  // namespace
 
 bool isObjectPath(std::string_view text) {
-  // The length is not limited: D-Bus does not limit the length of paths.
+  // Do not limit the length, because D-Bus does not limit the length of paths.
   if (text.empty() || text.front() != '/') return false;
   return text.size() == 1 || countElements(text.substr(1), kPathRules) > 0;
 }

@@ -23,8 +23,8 @@ Role roleOf(char code) { return kRoles[static_cast<unsigned char>(code)]; }
 
 bool isBasic(char code) { return roleOf(code) == Role::kBasic || code == 'h'; }
 
-// Scans complete types, and records whether one is unsupported. Recursion is bounded by the length
-// of a signature.
+// Scans complete types, and notes whether one of them is unsupported. The length of a signature, at
+// most kMaxSignatureBytes, bounds the recursion.
 class TypeScanner {
  public:
   explicit TypeScanner(std::string_view text) : text_(text) {}
@@ -35,8 +35,8 @@ class TypeScanner {
   bool scanType(unsigned arrays, unsigned structs) {
     const char code = next();
     const Role role = roleOf(code);
-    // Continue scanning: if the rest is invalid, the message is malformed, which ends the
-    // connection.
+    // Continue scanning even if the nesting is too deep. If the rest is invalid, the whole
+    // signature is invalid, which is the more serious error: it ends the connection.
     if (arrays > kMaxSignatureNesting || structs > kMaxSignatureNesting) tooDeep_ = true;
     if (code == 'a') {
       return peek() == '{' ? scanEntry(arrays + 1, structs + 1) : scanType(arrays + 1, structs);
@@ -69,7 +69,7 @@ class TypeScanner {
   // A date is the only supported struct.
   bool scanStruct(unsigned arrays, unsigned structs) {
     if (text_.substr(position_, 2) != "d)") unsupported_ = true;
-    // Scan at least one member: D-Bus has no empty structs.
+    // Scan at least one member, because D-Bus has no empty structs.
     do {
       if (!scanType(arrays, structs)) return false;
     } while (!atEnd() && peek() != ')');
@@ -94,7 +94,7 @@ SignatureShape shapeOfSignature(std::string_view signature) {
 }
 
 SignatureShape shapeOfType(std::string_view type) {
-  // Most types have one character.
+  // Most types have one character. They need no scanner.
   if (type.size() == 1 && roleOf(type.front()) == Role::kBasic) return SignatureShape::kTaken;
   if (type.size() > kMaxSignatureBytes) return SignatureShape::kBroken;
   TypeScanner scanner(type);

@@ -6,12 +6,13 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// The largest alignment of the wire.
+// The largest alignment of a type in the wire format.
 constexpr std::size_t kAlignment = 8;
 
 }  // namespace
 
-// Depends on the last bytes, which are those of the last reporter ID.
+// Hashes the last bytes. In most messages these are the last reporter ID, in which messages differ
+// most.
 std::size_t TailCache::indexOf(std::string_view bytes) {
   std::uint64_t last = 0;
   std::memcpy(&last, bytes.data() + bytes.size() - sizeof last, sizeof last);

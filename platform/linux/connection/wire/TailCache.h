@@ -13,12 +13,12 @@ namespace halvox::platform::linux_::dbus {
 // The arguments after the first one, of some recent messages.
 //
 // The messages of a session name the same category, type and reporter IDs most of the time. Equal
-// bytes decode to equal values, which are immutable: they are shared instead of decoded. Decoding
-// the lists of reporter IDs takes two allocations a message. Belongs to one thread. Owned by the
-// caller of the decoder.
+// bytes decode to equal values. Values are immutable, and those of the earlier message can
+// therefore be used again. This saves two allocations a message, for the lists of reporter IDs.
+// Belongs to one thread. Owned by the caller of the decoder.
 class TailCache {
  public:
-  // Longer arguments are decoded.
+  // Longer arguments are not stored.
   static constexpr std::size_t kMostBytes = 64;
 
   // The encoded arguments. Two equal sources decode to equal values.
@@ -29,9 +29,9 @@ class TailCache {
     bool bigEndian;
   };
 
-  // The values, or null. Valid until the next call of note().
+  // Returns the values of an equal source, or null. They are valid until the next call of note().
   [[nodiscard]] const std::vector<Value>* find(const Source& source) const;
-  // Keeps the values that were decoded from `source`.
+  // Stores the values that were decoded from `source`.
   void note(const Source& source, const Value* begin, const Value* end);
 
  private:

@@ -11,14 +11,15 @@ namespace {
 
 using Kind = DecodeError::Kind;
 
-// More elements than ordinary messages have in all containers that are open at a time. With a
-// smaller bound, such messages would allocate the scratch again each time. Without a bound, the
-// largest message would hold its memory until the service ends.
+// The scratch keeps memory for this many elements between messages: more than the open containers
+// of an ordinary message have together. With a smaller bound, ordinary messages would allocate the
+// scratch each time. Without a bound, the memory for the largest message would stay allocated until
+// the service ends.
 constexpr std::size_t kKeptElements = 1024;
 
-// Decodes the values of one body. `type` is always one valid, complete type: the signatures of
-// frames and variants are checked before they are used. `level` is the number of containers around
-// a value.
+// Decodes the values of one body. In all functions, `type` is one valid, complete type, because the
+// signatures of frames and variants are checked before they are used. `level` is the number of
+// containers around a value.
 class Decoder {
  public:
   Decoder(const Frame& frame, DecodeScratch& scratch)
@@ -55,7 +56,7 @@ class Decoder {
     return (reader_.*read)(text) ? Value(text) : malformed(type);
   }
 
-  // Notes what is wrong, and returns the absent value.
+  // Stores the error, and returns the absent value.
   Value refuse(Kind kind, std::string_view problem, std::string_view signature) {
     failed_ = true;
     kind_ = kind;
@@ -69,11 +70,12 @@ class Decoder {
 
   WireReader reader_;
   DecodeScratch& scratch_;  // of the caller
-  // False if the dictionary that is being decoded may have a key twice. Only for dictionaries with
-  // known keys, which are arguments: they are never inside each other.
+  // False if the current argument is a dictionary that may have a key twice. Used only for
+  // dictionaries that use the key cache. These are arguments and never inside each other, and one
+  // variable is enough.
   bool hasDistinctKeys_ = false;
-  // Describe the error. `path_` is where it occurred: after a failure, each enclosing container
-  // adds its own step as its decoding function returns.
+  // These members describe the error. `path_` is the place of the error: after a failure, each
+  // enclosing container adds its own step when its decoding function returns.
   bool failed_ = false;
   Kind kind_ = Kind::kMalformed;
   std::string_view problem_;
@@ -84,7 +86,8 @@ class Decoder {
 bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& arguments) {
   std::optional<TailCache::Source> tail;
   for (std::string_view rest = types; !rest.empty();) {
-    // Use the cache only after a dictionary: other requests are too small to gain from it.
+    // Use the cache only for the arguments after a dictionary. Other requests are too small to gain
+    // from it.
     if (scratch_.caches != nullptr && arguments.size() == 1 && arguments.front().isDictionary()) {
       tail = {rest, reader_.rest(), reader_.position(), !reader_.isHostOrder()};
       if (takeKnownTail(*tail, arguments)) return true;
@@ -97,8 +100,8 @@ bool Decoder::decodeArguments(std::string_view types, std::vector<Value>& argume
     }
     rest.remove_prefix(type.size());
   }
-  // The header gives the length of the body and the signature of its content. If the two disagree,
-  // nothing that was decoded can be trusted.
+  // The header has the length of the body and the signature of its content. If bytes remain, the
+  // two disagree, and nothing that was decoded can be trusted.
   if (!reader_.atLimit()) {
     refuse(Kind::kMalformed, "there are bytes after the last argument", types);
   } else if (tail.has_value()) {
@@ -140,7 +143,8 @@ Value Decoder::decode(std::string_view type, unsigned level) {
       return decodeText(type, &WireReader::readPath);
     case 'g':
       return decodeText(type, &WireReader::readSignature);
-    // D-Bus counts the levels of containers only. A number stays on the level of what contains it.
+    // Only containers have a level of their own, because D-Bus counts only the levels of
+    // containers.
     default:
       return decodeContainer(type, level + 1);
   }
@@ -152,11 +156,12 @@ Value Decoder::decodeContainer(std::string_view type, unsigned level) {
                   "containers nested more than 64 levels deep are not supported", type);
   }
   if (type.front() == 'v') return decodeVariant(level);
-  // Test for data before testing for an array: D-Bus has no other type for data, and bytes are
-  // copied as a block.
+  // Test for data before testing for an array. D-Bus has no other type for data than an array of
+  // bytes, and the bytes are copied as a block.
   if (type == "ay") return decodeData();
   if (type.starts_with("a{s")) return decodeDictionary(type, level);
-  // Dictionaries with other keys are valid on the wire, but ours have texts as keys.
+  // Dictionaries with other keys are valid on the wire, but a Dictionary of this system has only
+  // texts as keys.
   if (type.front() == 'a' && type[1] != '{') return decodeArray(type, level);
   if (type == "(d)") return decodeDate(type);
   return refuse(Kind::kUnsupported, "values of this type are not supported", type);
@@ -169,15 +174,15 @@ Value Decoder::decodeBoolean(std::string_view type) {
 
 Value Decoder::decodeDate(std::string_view type) {
   Date date;
-  // A struct begins on a multiple of 8 bytes, whatever its first member is.
+  // A struct begins at a multiple of 8 bytes, whatever its first member is.
   return reader_.align(8) && reader_.read(date.secondsSince1970) ? Value(date) : malformed(type);
 }
 
 Value Decoder::decodeVariant(unsigned level) {
   std::string_view type;
   if (!reader_.readVariantSignature(type)) return malformed("v");
-  // The check of the frame's signature has seen only `v`. What a variant holds is chosen by the
-  // sender for each value, and decode() relies on a valid type.
+  // Check the type here. The signature of the frame has only `v`, the sender chooses the type in
+  // the variant for each value, and decode() relies on a valid type.
   switch (shapeOfType(type)) {
     case SignatureShape::kTaken:
       return decode(type, level);
@@ -205,8 +210,8 @@ Value Decoder::decodeArray(std::string_view type, unsigned level) {
   if (!reader_.enterArray(alignmentOf(elementType.front()), outerLimit)) return malformed(type);
   const std::size_t first = scratch_.values.size();
   for (std::size_t element = 0; !reader_.atLimit(); ++element) {
-    // The elements of this array stay together, because an inner array removes its own elements
-    // from the scratch again.
+    // The elements of this array are consecutive in the scratch, because an inner array removes its
+    // own elements from there when it is complete.
     scratch_.values.push_back(decode(elementType, level));
     if (failed_) {
       path_.putBefore(element);
@@ -239,7 +244,7 @@ Dictionary Decoder::takeEntries(std::size_t first, unsigned level) {
   std::vector<Dictionary::Entry>& scratch = scratch_.entries;
   const std::span<Dictionary::Entry> entries = std::span(scratch).subspan(first);
   Dictionary dictionary;
-  // Too large if keys occur twice, which costs memory only.
+  // If keys occur twice, this reserves too much memory, which does no other harm.
   if (!entries.empty()) {
     dictionary.reserve(entries.size() + (level == 1 ? scratch_.addedEntries : 0));
   }
@@ -255,7 +260,7 @@ Dictionary Decoder::takeEntries(std::size_t first, unsigned level) {
   return dictionary;
 }
 
-// Decodes an entry whose key and type were seen before. Returns false if they were not.
+// Decodes an entry whose key and type are in the key cache. Returns false if they are not.
 bool Decoder::decodeKnownEntry(unsigned level) {
   if (!reader_.align(8)) return false;  // decodeEntry() fails in the same way
   const KeyCache::Head head = scratch_.caches->keys.find(reader_.rest());
@@ -273,7 +278,7 @@ bool Decoder::decodeKnownEntry(unsigned level) {
 }
 
 void Decoder::decodeEntry(std::string_view type, unsigned level) {
-  // Of a{s…}, the part between the key's type and the closing brace.
+  // In a{s…}, the type of the values is between the key's type and the closing brace.
   const std::string_view valueType = type.substr(3, type.size() - 4);
   std::string_view text;
   if (!reader_.align(8)) {
@@ -293,7 +298,7 @@ void Decoder::decodeEntry(std::string_view type, unsigned level) {
   const Key key(text);
   if (usesKeyCache(type, level)) {
     scratch_.caches->keys.note(head, key);
-    // The key may have been in the dictionary before, with a value that is not in the cache.
+    // This dictionary may have had the key before, in an entry that the cache did not store.
     hasDistinctKeys_ = false;
   }
   scratch_.entries.push_back({key, std::move(value)});
@@ -307,7 +312,7 @@ DecodeError Decoder::error() const {
   error.message = error.key + (error.key.empty() ? "" : ": ");
   error.message += problem_;
   error.message += " (signature \"" + error.signature + "\"";
-  // The path is enough to find an unsupported value. For broken bytes, their position may be all
+  // The path is enough to find an unsupported value. If bytes are broken, their position may be all
   // that is known.
   if (kind_ == Kind::kMalformed) {
     error.message += ", byte " + std::to_string(reader_.position()) + " of the body";
@@ -342,8 +347,8 @@ std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expec
 std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expectedSignature,
                                       std::vector<Value>& arguments, DecodeScratch& scratch) {
   arguments.clear();
-  // Check this before the body is read: a client with wrong arguments gets an error and stays
-  // connected.
+  // Compare the signatures before reading the body. A client that sends wrong arguments then gets
+  // an error and stays connected.
   if (frame.header.signature != expectedSignature) {
     return wrongSignature(frame.header.signature, expectedSignature);
   }
@@ -353,8 +358,8 @@ std::optional<DecodeError> decodeBody(const Frame& frame, std::string_view expec
     error = decoder.error();
     arguments.clear();
   }
-  // Release the values after an error too: those of a refused message must not live until the next
-  // message.
+  // Release the values after an error, too. The values of a refused message must not live until the
+  // next message.
   scratch.clear();
   return error;
 }

@@ -24,8 +24,8 @@ struct DecodeError {
   };
   Kind kind = Kind::kMalformed;
   // The place of the value: the number of the argument, counted from 1, and the path of dictionary
-  // keys and element numbers (from 0) inside it, as in `argument 1, key "a"."b"[3]`. Long keys are
-  // cut. Empty for a wrong signature.
+  // keys and element numbers (from 0) inside the argument, as in `argument 1, key "a"."b"[3]`. Long
+  // keys are cut. Empty for kWrongSignature.
   std::string key;
   // The signature of the value; empty if it is not known. Cut if it is malformed and long.
   std::string signature;
@@ -34,28 +34,28 @@ struct DecodeError {
   std::string message;
 };
 
-// What earlier bodies contained. It makes decoding faster and never changes the result. Belongs to
-// one thread.
+// Parts of earlier bodies that are decoded already. They make decoding faster and never change the
+// result. Belongs to one thread.
 struct DecodeCaches {
   KeyCache keys;
   TailCache tails;
 };
 
-// What decoding one body leaves for the next. A caller that decodes many bodies keeps one for all
-// of them. Belongs to one thread.
+// Memory that decoding one body leaves for the next. A caller that decodes many bodies uses one
+// scratch for all of them. Belongs to one thread.
 struct DecodeScratch {
-  // The elements of containers that are being decoded, innermost last; empty between calls. Arrays
-  // and dictionaries are made with their final size, which is known only after their last element.
-  // Without these, each container would be allocated twice.
+  // The elements of the containers that are being decoded, those of the innermost container last.
+  // Empty between calls. The elements gather here, because the size of a container is known only
+  // after its last element, and a container whose size is known is allocated only once.
   std::vector<Value> values{};
   std::vector<Dictionary::Entry> entries{};
-  // For bodies that resemble each other. If null, each body is decoded as if it were the first.
+  // Useful if bodies resemble each other. If null, each body is decoded as if it were the first.
   std::unique_ptr<DecodeCaches> caches{};
-  // How many entries the receiver adds to a dictionary that is an argument. The dictionary is made
-  // with room for them.
+  // How many entries the receiver of the arguments will add to a dictionary that is an argument.
+  // The dictionary is allocated with space for them.
   std::size_t addedEntries = 0;
 
-  // Empties the elements. Gives memory back that only an unusually large message needed.
+  // Removes the elements. Frees memory that only an unusually large message needed.
   void clear();
 };
 
@@ -79,7 +79,7 @@ struct DecodeScratch {
                                                     std::string_view expectedSignature,
                                                     std::vector<Value>& arguments,
                                                     DecodeScratch& scratch);
-// Does the same with a scratch of its own, for occasional messages.
+// Does the same as decodeBody() above with a temporary scratch, for occasional messages.
 [[nodiscard]] std::optional<DecodeError> decodeBody(const Frame& frame,
                                                     std::string_view expectedSignature,
                                                     std::vector<Value>& arguments);

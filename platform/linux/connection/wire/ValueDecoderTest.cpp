@@ -24,7 +24,7 @@ Values valuesOf(std::string_view signature, const WireBytes& body) {
   return arguments;
 }
 
-// A dictionary a{sv} of one entry whose value is written by the test.
+// Returns a dictionary a{sv} of one entry. The test writes the entry's value.
 WireBytes entryOf(std::string_view key, std::string_view variantSignature,
                   const std::string& content) {
   WireBytes entry;

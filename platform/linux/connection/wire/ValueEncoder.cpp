@@ -13,8 +13,8 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// Arrays nested deeper than this are written as arrays of variants. To find out whether all
-// elements have one type, each element is looked at once for each array around it. This bounds the
+// Arrays nested deeper than this are written as arrays of variants. The search for a common type of
+// an array's elements visits each element once for each array around it. This limit bounds the
 // effort.
 constexpr unsigned kMaxUniformNesting = 8;
 
@@ -47,7 +47,7 @@ char naturalCode(NumberKind kind) {
       return 'x';
     case NumberKind::kUInt64:
       return 't';
-    // D-Bus has no floating-point type of 32 bits.
+    // D-Bus has no floating-point type of 32 bits. A float becomes a double.
     case NumberKind::kFloat:
     case NumberKind::kDouble:
       return 'd';
@@ -57,7 +57,8 @@ char naturalCode(NumberKind kind) {
 
 std::string naturalType(const Value& value, unsigned arrays);
 
-// The type of an array whose elements have one type. `av` for any other and for an empty array.
+// Returns the type of an array: that of its elements after an `a` if they all have one type, and
+// `av` otherwise.
 std::string naturalArrayType(const Array& array, unsigned arrays) {
   // An empty array has no element that could give it a type.
   if (array.empty() || arrays > kMaxUniformNesting) return "av";
@@ -68,7 +69,8 @@ std::string naturalArrayType(const Array& array, unsigned arrays) {
   return uniform && !first.empty() ? "a" + first : "av";
 }
 
-// Empty for the absent value. `arrays` is the number of arrays around the value.
+// Returns the type of a value in a variant; empty for the absent value. `arrays` is the number of
+// arrays around the value.
 std::string naturalType(const Value& value, unsigned arrays) {
   switch (value.kind()) {
     case ValueKind::kNone:
@@ -180,7 +182,7 @@ bool ValueEncoder::appendStringAs(char code, const Value& value) {
     appendSignature(text);
     return true;
   }
-  // Check this before anything is appended: the wire has only 32 bits for a length.
+  // Check the length before appending the text, because the wire has only 32 bits for a length.
   if (text.size() > kMaxMessageBytes) return false;
   if (!(code == 'o' ? isObjectPath(text) : isUtf8WithoutNul(text))) return false;
   appendText(text);
@@ -232,7 +234,8 @@ bool ValueEncoder::appendArray(std::string_view type, const Array& array, unsign
 bool ValueEncoder::appendDictionary(std::string_view type, const Dictionary& dictionary,
                                     unsigned level) {
   const std::string_view valueType = type.substr(3, type.size() - 4);
-  // Count this level although D-Bus does not: some readers count it, and would refuse the message.
+  // Count the entry as a level although D-Bus does not. Some readers count it, and would refuse a
+  // message that is nested deeper.
   const unsigned entryLevel = level + 1;
   if (entryLevel > kMaxNesting) return false;
   std::size_t lengthPosition = 0;
@@ -250,7 +253,8 @@ std::size_t ValueEncoder::beginArray(std::size_t elementAlignment, std::size_t& 
   align(sizeof(std::uint32_t));
   lengthPosition = out_.size();
   appendNumber(std::uint32_t{0});
-  // The length of an array excludes the padding before its first element, also when there is none.
+  // Even an empty array has the padding before its first element. The array's length does not
+  // include this padding.
   align(elementAlignment);
   return out_.size();
 }

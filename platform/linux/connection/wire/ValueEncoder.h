@@ -13,19 +13,19 @@
 namespace halvox::platform::linux_::dbus {
 
 // Appends numbers, texts and values in wire format, little endian, to a buffer in which a message
-// starts at `start`. Alignment counts from there. The caller owns the buffer, which must outlive
-// this.
+// starts at `start`. Alignment is relative to `start`. The caller owns the buffer, which must
+// outlive this.
 class ValueEncoder {
  public:
   ValueEncoder(std::string& out, std::size_t start) : out_(out), start_(start) {}
 
   // Appends one value for each type of a signature. Returns false if a value does not fit its type,
-  // or if the numbers of values and types differ. What was appended before the failure stays in the
-  // buffer. FrameWriter.h has the rules.
+  // or if the numbers of values and types differ. Bytes that were appended before the failure stay
+  // in the buffer. FrameWriter.h says which values fit which types.
   [[nodiscard]] bool appendAll(std::string_view signature, std::span<const Value> values);
 
   void align(std::size_t alignment);
-  // Appends padding, then the number: the alignment of a number is its size.
+  // Appends padding, then the number. The alignment of a number is its size.
   template <typename Number>
   void appendNumber(Number number) {
     align(sizeof number);
@@ -35,7 +35,7 @@ class ValueEncoder {
       std::reverse(bytes, bytes + sizeof bytes);
     out_.append(bytes, sizeof bytes);
   }
-  // These two functions do not check the characters.
+  // These two functions do not check the characters of the text.
   void appendText(std::string_view text);
   void appendSignature(std::string_view signature);
   // Overwrites a length that was appended as 0.

@@ -6,8 +6,8 @@
 namespace halvox::platform::linux_::dbus {
 namespace {
 
-// kMaxNesting bounds the recursion. The length of the signature does not: each variant can hold
-// another one.
+// kMaxNesting bounds the recursion. The length of the signature would not bound it, because each
+// variant can contain another variant.
 bool skip(WireReader& reader, std::string_view type, unsigned level);
 
 template <typename Number>
@@ -16,7 +16,7 @@ bool skipNumber(WireReader& reader) {
   return reader.read(number);
 }
 
-// The members of a struct or entry.
+// Skips the members of a struct or of a dictionary entry.
 bool skipMembers(WireReader& reader, std::string_view types, unsigned level) {
   if (!reader.align(8)) return false;
   while (!types.empty()) {
@@ -31,7 +31,7 @@ bool skipArray(WireReader& reader, std::string_view element, unsigned level) {
   std::size_t outerLimit = 0;
   if (!reader.enterArray(alignmentOf(element.front()), outerLimit)) return false;
   while (!reader.atLimit()) {
-    // An entry is not a level of its own, in contrast to a struct.
+    // A dictionary entry, unlike a struct, is not a level of its own.
     const bool sound = element.front() == '{'
                            ? skipMembers(reader, element.substr(1, element.size() - 2), level)
                            : skip(reader, element, level);

@@ -28,11 +28,11 @@ bool WireReader::enterArray(std::size_t elementAlignment, std::size_t& outerLimi
   std::uint32_t length = 0;
   if (!read(length)) return false;
   if (length > kMaxArrayBytes) return fail("the array is longer than 64 MiB");
-  // The length does not include this padding, and an empty array has it too.
+  // Skip the padding even if the array is empty. The length does not include the padding.
   if (!align(elementAlignment)) return false;
   if (length > limit_ - position_) return fail(kEndsTooEarly);
-  // An element that claims to be longer than its array must not be read from what follows the
-  // array.
+  // Until leaveArray(), reading stops at the end of the array. An element that claims to be longer
+  // than its array must not be read from the bytes after the array.
   outerLimit = limit_;
   limit_ = position_ + length;
   return true;

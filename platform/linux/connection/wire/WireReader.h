@@ -10,14 +10,14 @@
 
 namespace halvox::platform::linux_::dbus {
 
-// Reads the basic types of the wire, one after the other, with all checks that concern a single
-// value. The first byte must be on an 8-byte boundary of the message.
+// Reads values of the basic types of the wire, one after the other, with all checks that concern a
+// single value. The first byte must be at a multiple of 8 bytes in the message.
 //
-// Each read… function returns false if the bytes break a rule. `problem()` then says which, and the
-// reader must not be used further. Texts point into the bytes, which the caller owns.
+// Each read… function returns false if the bytes break a rule. `problem()` then says which rule,
+// and the reader must not be used further. Texts point into the bytes, which the caller owns.
 //
-// Problems are constants: the reader allocates nothing, and hostile bytes cannot get into its
-// texts.
+// The texts of problems are constants. The reader therefore allocates nothing, and hostile bytes
+// cannot get into these texts.
 class WireReader {
  public:
   WireReader(std::span<const std::byte> bytes, bool bigEndian)
@@ -31,7 +31,8 @@ class WireReader {
 
   // True if the bytes are in the byte order of this machine.
   [[nodiscard]] bool isHostOrder() const { return !swapped_; }
-  // What is left of the array or message, and how to pass over its front unread.
+  // rest() returns the bytes that remain of the array or message. skip() passes over some of them
+  // without reading them.
   [[nodiscard]] std::string_view rest() const { return {bytes_ + position_, limit_ - position_}; }
   void skip(std::size_t bytes) { position_ += bytes; }
 
@@ -52,7 +53,7 @@ class WireReader {
     return true;
   }
 
-  // Skips padding, then reads a number: the alignment of a number is its size.
+  // Skips padding, then reads a number. The alignment of a number is its size.
   template <typename Number>
   bool read(Number& number) {
     if (!align(sizeof number)) return false;
@@ -70,7 +71,8 @@ class WireReader {
     if (!readUncheckedText(text)) return false;
     return isUtf8WithoutNul(text) || fail("the text is not valid UTF-8 or contains a NUL");
   }
-  // Reads a text without checking its characters, for callers with a stricter rule.
+  // Reads a text without checking its characters. For callers that check the text by a stricter
+  // rule.
   bool readUncheckedText(std::string_view& text) {
     std::uint32_t length = 0;
     return read(length) && takeTerminated(length, text);
@@ -83,11 +85,11 @@ class WireReader {
     return read(length) && takeTerminated(length, signature);
   }
 
-  // Reads the length of an array whose elements have that alignment, and skips to the first
-  // element. Until leaveArray(), nothing can be read beyond the end of the array.
+  // Reads the length of an array, and skips the padding before its first element. Until
+  // leaveArray(), nothing can be read beyond the end of the array.
   bool enterArray(std::size_t elementAlignment, std::size_t& outerLimit);
   void leaveArray(std::size_t outerLimit) { limit_ = outerLimit; }
-  // The remaining bytes of the array.
+  // Reads and returns the remaining bytes of the array.
   std::span<const std::byte> takeRest();
 
  private:

@@ -1,6 +1,6 @@
 #pragma once
 
-// Made by make_golden_frames.py; not to be edited.
+// Made by make_golden_frames.py. Do not edit.
 
 #include <string_view>
 

@@ -25,7 +25,7 @@ inline std::string fromHex(std::string_view hex) {
   return bytes;
 }
 
-// Puts values on the wire one by one and lets tests break any rule. Shares no code with the
+// Writes values in wire format one by one, and lets tests break any rule. Shares no code with the
 // encoder, because tests must not trust the code under test.
 class WireBytes {
  public:
@@ -78,7 +78,7 @@ class WireBytes {
   std::string bytes_;
 };
 
-// The header of a whole message, the fields of which a test writes itself.
+// The header of a whole message. The test writes the header fields itself.
 inline std::string frameOf(std::uint8_t type, const WireBytes& fields, std::string_view body,
                            std::uint32_t serial = 1) {
   WireBytes frame(fields.bigEndian());
@@ -100,7 +100,7 @@ inline std::string callWith(std::string_view signature, const WireBytes& body) {
   return frameOf(1, callFields(signature, body.bigEndian()), body.bytes());
 }
 
-// A frame that is only a signature and a body, for tests of the body alone.
+// Returns a frame that has only a signature and a body, for tests of the body alone.
 inline Frame bodyFrame(std::string_view signature, const WireBytes& body) {
   Frame frame;
   frame.header.signature = signature;

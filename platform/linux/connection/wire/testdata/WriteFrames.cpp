@@ -1,5 +1,5 @@
-// Prints frames of ours for another implementation to read: a line each, of the frame in
-// hexadecimal, a tab, and what its body is in GLib's text form ("-" for none).
+// Prints frames that our encoder wrote, for another implementation to read. Each line has the frame
+// in hexadecimal, a tab, and the body in GLib's text form ("-" for an empty body).
 
 #include <cmath>
 #include <iostream>
