@@ -31,7 +31,7 @@ struct IssueMetricCounters {
 };
 
 // received = delivered (to the bug-capture service) + counted + repeated. The bug-capture state
-// manager holds its own.
+// manager holds these counters itself.
 struct BugCaptureCounters {
   explicit BugCaptureCounters(platform::StatisticsService& statistics)
       : received(statistics.counter("bug capture bridge", "received")),

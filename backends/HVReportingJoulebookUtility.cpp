@@ -34,7 +34,8 @@ Dictionary enginePayload(const Dictionary& message, const Value& onTime,
   Dictionary payload;
   payload.set(duration, onTime);
   const Value appName = HVReportingUtilityRetrieveAppName(session.configuration());
-  // Always true, because the name defaults to "Unknown". The test and its line are required anyway.
+  // Always true, because the name defaults to "Unknown". The test and its log line are nevertheless
+  // required.
   if (appName != Value()) {
     payload.set(application, appName);
   } else {

@@ -12,9 +12,10 @@
 #include "platform/value.h"
 
 // Stateless functions that all components share. Any thread may call them. Only
-// HVReportingUtilityWait blocks. None reports an error: each states its substitute for unknown
-// values. Wait, Signal, IsABTestModeOn, ExtractSessionIDFromReporterID and RoundWithPlaces have no
-// caller but their tests. They are required all the same: do not remove them.
+// HVReportingUtilityWait blocks. None reports an error: for an unknown value each returns a
+// substitute, which its comment states. Wait, Signal, IsABTestModeOn,
+// ExtractSessionIDFromReporterID and RoundWithPlaces have no caller but their tests. They are
+// required all the same: do not remove them.
 namespace halvox {
 
 // --- Texts of the vocabulary --------------------------------------------------------------------
@@ -33,7 +34,7 @@ std::string HVReportingUtilityCategoryString(AudioEventCategory category);
 
 // Returns the text of a type; "Generic" for unlisted values. Lives as long as the process.
 std::string_view HVReportingUtilityTypeString(AudioEventType type);
-// The same for a type widened to 32 bits: values above 65535 are unlisted, not truncated.
+// Does the same for a type in 32 bits: values above 65535 are unlisted, not truncated.
 std::string_view HVReportingUtilityTypeString(std::uint32_t type);
 
 // Returns the name of a service. Lives as long as the process. Unlisted values are "telephony",

@@ -37,8 +37,9 @@ void HVReportingUtilityVEKStateManager::handleEvent(
   static const Key activeTime("Haptic_Active_Hardware_Time_Seconds");
   if (message->find(activeTime) == nullptr) return;
   counters_.received.add();
-  // Compared with the time stamps, unlike a session's history: a client that repeats a report gets
-  // new stamps. Only one message that is sent to several sessions repeats itself. This is required.
+  // The comparison includes the time stamps, unlike that of a session's history. A report that a
+  // client sends again has new stamps and is not a repetition; the same message for several
+  // sessions is one. This is required.
   if (*message == messageCache()) {
     counters_.repeated.add();
     return;

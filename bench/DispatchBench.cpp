@@ -58,7 +58,7 @@ void handedOver(benchmark::State& state) {
   Fixture fixture;
   const auto total = std::make_shared<std::uint64_t>(0);
   for (auto _ : state) {
-    // From 1: the last job is the one that ends the wait.
+    // Counts from 1, because the last job is the one below, which ends the wait.
     for (std::int64_t job = 1; job < state.range(0); ++job) {
       fixture.queue->async(JobWeight::kBrief, makeJob(total));
     }

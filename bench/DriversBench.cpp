@@ -32,7 +32,8 @@ using Clock = std::chrono::steady_clock;
 constexpr int kChannels = 500;
 constexpr int kChannelsPerFile = 10;
 constexpr int kSessions = 64;
-// Between two measurements, so that the sources' threads sleep as they do in a service.
+// The pause between two measurements, in which the sources' threads fall asleep as they do in a
+// service.
 constexpr std::chrono::milliseconds kPause{5};
 constexpr std::array kGroups{
     "TarnoQ7AMP", "Speaker", "MCA", "Haptics", "StateTransitionTimes_ms", "Rx", "Tx", "IOSndFam2"};
@@ -178,7 +179,7 @@ void measureThreads(const Sampler& sampler) {
 void measureMemory(const Sampler& sampler) {
   std::vector<SnapShot> sessions;
   sessions.reserve(kSessions);
-  // Not counted: what the first snapshot makes once.
+  // What only the first snapshot allocates is not counted.
   static_cast<void>(sampler.snapShot());
   const std::size_t before = mallinfo2().uordblks;
   for (int session = 0; session < kSessions; ++session) {

@@ -136,7 +136,7 @@ void compare(TLMReportingService& link, const char* url, Run run) {
   std::vector<double> backend;
   std::vector<double> library;
   for (int round = 0; round < run.rounds; ++round) {
-    // In turns, so that other work on the machine meets both alike.
+    // The two take turns, so that other work on the machine affects both alike.
     backend.push_back(measureBackend(link, run.messages));
     library.push_back(measureLibrary(context.get(), body, run.messages));
   }

@@ -144,8 +144,8 @@ class JetStream {
     const auto width = static_cast<int>(std::string(id).size());
     jsPubOptions options;
     jsPubOptions_Init(&options);
-    // The plain library publishes in this process, the service in its own. Each is charged with the
-    // process that does the work.
+    // The plain library publishes in this process, the service in its own. For each, the CPU time
+    // of the process that does the work is measured.
     const Stopwatch watch(ownCpu);
     for (std::int64_t number = 0; number < messages; ++number) {
       char text[64];
@@ -198,7 +198,8 @@ Result through(const Server& server, std::int64_t messages,
   const std::int64_t before = stored();
   const auto client = server.client(1);
   client->pipeline(kWarmUp, kWindow, shape);
-  // Waits until they are stored: their work must not count as that of the measured ones.
+  // Waits until these messages are stored, because their work must not be measured with that of the
+  // next ones.
   waitUntil("the first messages", [&] { return stored() >= before + kWarmUp; });
   const Stopwatch watch([&server] { return server.process().cpuTime(); });
   client->pipeline(messages, kWindow, shape);

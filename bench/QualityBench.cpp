@@ -1,6 +1,7 @@
-// How long a request waits beside a flood of other jobs, by the quality of service of the flood:
-// none, the same as that of requests (as if there were no qualities), utility and background. The
-// kinds take turns within one run, so that other work on the machine meets all of them alike.
+// How long a request waits while a flood of other jobs runs. There are four kinds of flood: none,
+// one with the quality of service of requests (as if there were no qualities), one with utility
+// quality and one with background quality. The kinds take turns within one run, so that other work
+// on the machine affects all of them alike.
 //
 //   halvox_quality_bench [ROUNDS]
 
@@ -52,7 +53,8 @@ class Flood {
   Flood(const Flood&) = delete;
   Flood& operator=(const Flood&) = delete;
   ~Flood() {
-    // Each queue has at most one more job, after which the one below ends the wait.
+    // Each queue has at most one more job of the flood. The job that is added here runs after it
+    // and ends the wait.
     *isOver_ = true;
     for (const auto& queue : queues_) {
       std::promise<void> done;
@@ -95,8 +97,8 @@ void measureRound(DispatchService& service, DispatchQueue& requests, Kind& kind)
   auto next = Clock::now();
   for (int request = 0; request < kRequestsARound; ++request) {
     next += kRequestPause;
-    // At fixed times, not after a fixed pause: a request that waited long does not thin out the
-    // ones after it.
+    // Requests are sent at fixed times, not after a fixed pause: a request that waited long then
+    // does not make the following ones rarer.
     std::this_thread::sleep_until(next);
     std::promise<Clock::time_point> ended;
     const auto began = Clock::now();

@@ -111,7 +111,8 @@ void BM_SendMessage(benchmark::State& state, std::int64_t clients, std::int64_t 
   std::int64_t sinceFill = 0;
   while (state.KeepRunningBatch(kBatch)) {
     state.PauseTiming();
-    // The measured messages lengthen the history. Start it again before that counts.
+    // The measured messages lengthen the history. Fill it anew before the additional length affects
+    // the result.
     if ((sinceFill += kBatch) > 500'000) {
       fill();
       sinceFill = 0;

@@ -55,7 +55,7 @@ double statusKilobytes(const std::string& name) {
   return 0;
 }
 
-// 5 resets the peak resident memory of a process; see proc(5).
+// Writing 5 resets the peak resident memory of a process; see proc(5).
 void forgetPeak() { std::ofstream("/proc/self/clear_refs") << "5"; }
 
 template <typename Make>
@@ -78,7 +78,7 @@ void BM_Stop(benchmark::State& state, Make make) {
   double history = 0;
   for (auto _ : state) {
     state.PauseTiming();
-    // Gives back what the last iteration freed, so that the base does not contain it.
+    // Returns to the system what the last iteration freed, so that the base does not contain it.
     ::malloc_trim(0);
     const double base = statusKilobytes("VmRSS:");
     const auto session = startedSession(make);

@@ -187,7 +187,8 @@ void storeMessage(benchmark::State& state) {
       caller += cpuSeconds(RUSAGE_THREAD) - start;
     }
   }
-  // Included: what the writer still has to do belongs to the messages.
+  // The close is measured too, because it waits for the work that these messages have left to the
+  // writer.
   bench.store->close();
   const double all = cpuSeconds(RUSAGE_SELF) - before;
   struct rusage use {};

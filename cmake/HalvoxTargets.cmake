@@ -12,7 +12,7 @@ target_compile_options(halvox_flags INTERFACE
   $<$<COMPILE_LANGUAGE:CXX>:-Wconversion -Wnon-virtual-dtor>
   $<$<AND:$<COMPILE_LANGUAGE:CXX>,$<CXX_COMPILER_ID:Clang>>:-Wthread-safety>)
 # GCC 12 reports overruns inside its own std::string when it optimises. clang and the sanitizers
-# check for real ones.
+# check for real overruns.
 target_compile_options(halvox_flags INTERFACE
   $<$<CXX_COMPILER_ID:GNU>:-Wno-array-bounds -Wno-restrict -Wno-stringop-overflow -Wno-stringop-overread>)
 target_include_directories(halvox_flags INTERFACE ${CMAKE_SOURCE_DIR})
@@ -34,7 +34,7 @@ else()
 endif()
 
 # What guides the fuzzers: code in the libraries and in the fuzzers that records where it has been.
-# Tests go without: they would compile and run more slowly for nothing.
+# Tests are built without this, because it would only slow down their compilation and their runs.
 add_library(halvox_fuzzed INTERFACE)
 if(HALVOX_FUZZ)
   target_compile_options(halvox_fuzzed INTERFACE -fsanitize=fuzzer-no-link)
@@ -54,8 +54,8 @@ target_precompile_headers(halvox_precompiled_test PRIVATE
   ${halvox_common_headers} <gmock/gmock.h> <gtest/gtest.h>)
 target_link_libraries(halvox_precompiled_test PRIVATE halvox_flags GTest::gmock)
 
-# With the preset `tidy`, clang-tidy reads each source that is compiled. Tests and their helpers, fakes
-# and benchmarks go without, as in scripts/check.
+# With the preset `tidy`, clang-tidy reads each source that is compiled. Tests and their helpers,
+# fakes and benchmarks are skipped, as in scripts/check.
 option(HALVOX_TIDY "Run clang-tidy on each source that is compiled (clang only)" OFF)
 function(halvox_tidy name)
   file(RELATIVE_PATH folder ${CMAKE_SOURCE_DIR} ${CMAKE_CURRENT_SOURCE_DIR})
@@ -65,8 +65,8 @@ function(halvox_tidy name)
   endif()
 endfunction()
 
-# Compile several sources of a target as one. That halves the time of a whole build, and more than
-# doubles that of a build after one change. The presets for daily work leave it off.
+# Compile several sources of a target as one. This halves the time of a whole build, and more than
+# doubles the time of a build after one change. The presets for daily work leave it off.
 option(HALVOX_UNITY "Compile several sources of a target as one" OFF)
 function(halvox_unity name)
   set_property(GLOBAL APPEND PROPERTY HALVOX_UNITY_TARGETS ${name})

@@ -61,7 +61,7 @@ IOReportService::Samples createSamples(const HVReportingIOChannelSubscription& s
 IOReportService::Samples createDelta(const DriverSnapShot& snapShot, const std::string& description,
                                      const IOReportService::Samples& current) {
   const auto found = snapShot.find(description);
-  // Null if the group could not be sampled at the start. There is no difference then.
+  // Null if the group could not be sampled at the start; then there is no difference.
   const IOReportService::Samples previous = found == snapShot.end() ? nullptr : found->second;
   std::optional<IOReportError> error;
   auto delta = platform::ioReport().IOReportCreateSamplesDelta(previous, current, error);
@@ -186,7 +186,7 @@ void HVReportingDriverUtility::sendDriverLogsForSession(
     std::optional<IOReportError> error;
     const auto current = createSamples(subscription, *moment, error);
     kDriverLog.info("done getting latest samples");
-    // Sampled also for a session without a snapshot, because an error of the sample is logged.
+    // Sampled even for a session without a snapshot, because an error of the sample must be logged.
     if (current == nullptr) logSampleError(error);
     if (current == nullptr || !snapShot.has_value()) continue;
     const auto delta = createDelta(*snapShot, subscription.driver().description(), current);

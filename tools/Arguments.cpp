@@ -29,7 +29,7 @@ std::optional<Number> parseWhole(std::string_view text) {
   return number;
 }
 
-// Refuses "inf" and "nan", which the conversion accepts.
+// Parses a finite number. Refuses "inf" and "nan", which the conversion would accept.
 std::optional<double> parseReal(std::string_view text) {
   double number = 0;
   const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), number);
@@ -60,7 +60,8 @@ std::string listDomains() {
 std::optional<client::Category> parseNumberInDomain(std::string_view text) {
   const auto separator = text.find('_');
   if (separator == std::string_view::npos) return std::nullopt;
-  // Domains are found only together with a category. "Undefined" is category 0 and adds no bits.
+  // The look-up finds a domain only together with a category. "Undefined" is category 0, which adds
+  // no bits to the domain.
   const auto domain = client::findCategory(std::string(text.substr(0, separator)) + "_Undefined");
   const auto number = parseWhole<std::uint16_t>(text.substr(separator + 1));
   if (!domain || !number) return std::nullopt;
@@ -91,7 +92,7 @@ Result<std::uint64_t> parseCount(std::string_view text) {
 }
 
 Result<client::Category> parseCategory(std::string_view text) {
-  // Numbers first: a category can have any 32 bits, and most of them have no name.
+  // Numbers are tried first: a category can have any 32 bits, and most of them have no name.
   if (const auto number = parseWhole<client::Category>(text)) return *number;
   if (const auto category = client::findCategory(text)) return *category;
   if (const auto category = parseNumberInDomain(text)) return *category;
@@ -112,7 +113,8 @@ Result<client::ServiceType> parseServiceType(std::string_view text) {
 }
 
 Result<std::chrono::milliseconds> parseSeconds(std::string_view text) {
-  // About 30 years. Keeps the conversion to milliseconds and later sums of times within 64 bits.
+  // About 30 years. The bound keeps the conversion to milliseconds and later sums of times within
+  // 64 bits.
   constexpr double kMost = 1e9;
   const auto seconds = parseReal(text);
   if (!seconds || *seconds <= 0 || *seconds > kMost) {

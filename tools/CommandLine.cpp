@@ -54,7 +54,8 @@ bool isFor(GroupPlace place, CommandSource source) {
   return false;
 }
 
-// Removes the library's type name TEXT: the name of the argument already says what it is.
+// Removes the library's type name TEXT from the help, because the name of an argument already says
+// what the argument is.
 void removeTypeNames(CLI::App& app) {
   for (CLI::Option* option : app.get_options()) {
     if (option->get_positional()) option->type_name("");
@@ -72,7 +73,8 @@ void addGroups(CommandSet& commands, CommandSource source) {
   }
 }
 
-// The library shows options before the command in a usage line. A script's line has none there.
+// The library shows "[OPTIONS]" before the command in a usage line. A line of a script has no
+// options there.
 class HelpFormatter final : public CLI::Formatter {
  public:
   std::string make_usage(const CLI::App* app, std::string name) const override {
@@ -83,7 +85,7 @@ class HelpFormatter final : public CLI::Formatter {
 
 // Replaces the library's headings with ours. Commands inherit them from the program.
 void nameThings(CLI::App& app) {
-  // Set before any command is added: commands copy these settings.
+  // Set before any command is added, because commands copy these settings.
   app.set_help_flag("-h,--help", "Print this help");
   const auto formatter = std::make_shared<HelpFormatter>();
   formatter->label("SUBCOMMAND", "COMMAND");
@@ -93,7 +95,7 @@ void nameThings(CLI::App& app) {
   app.formatter(formatter);
 }
 
-// Returns the command that was given and its sub-command: none, one or two.
+// Returns the command that was given and its sub-command, as far as the arguments name them.
 std::vector<const CLI::App*> chosenOf(const CLI::App& app) {
   std::vector<const CLI::App*> chosen;
   for (auto below = app.get_subcommands(); !below.empty();

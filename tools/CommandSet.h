@@ -52,8 +52,8 @@ class CommandSet {
   template <typename Make, typename Run>
   void onRun(CLI::App& app, Make make, Run run) {
     app.callback([this, make, run] {
-      // The library calls the callback of a sub-command before that of its parent. The sub-command
-      // is the one that was given.
+      // Only the first call counts. The library calls the callback of a sub-command before that of
+      // its parent, and the sub-command is the command that was given.
       if (!command_) command_.emplace(make(), Command::Run<decltype(make())>(run));
     });
   }
@@ -96,7 +96,7 @@ CLI::Option* addParsed(CLI::App& app, const std::string& name, Target& target,
       description);
 }
 
-// The same for an option that may be given several times; appends each value to `targets`.
+// Does the same for an option that may be given several times; appends each value to `targets`.
 template <typename T, typename Targets>
 CLI::Option* addEach(CLI::App& app, const std::string& name, Targets& targets,
                      platform::linux_::Result<T> (*parse)(std::string_view),

@@ -32,7 +32,8 @@ class Complaint {
   Complaint(std::string command, OutputForm form, std::ostream& out, std::ostream& errors)
       : command_(std::move(command)), form_(form), out_(out), errors_(errors) {}
 
-  // Reports a failure and returns `status`. `kind` is the kind in JSON; if empty, that of `status`.
+  // Reports a failure and returns `status`. `kind` is the kind in JSON; if it is empty,
+  // failureKind(status) is used.
   ExitStatus operator()(ExitStatus status, std::string_view what, std::string_view kind = {}) const;
   // Reports a problem that does not end the command: only a line on `errors`. An object on `out`
   // would mean that the command failed.

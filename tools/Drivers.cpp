@@ -30,7 +30,7 @@ class ErrorLog final : public platform::LogCategory {
   ErrorLog() : LogCategory(platform::LogLevel::kError) {}
   void write(platform::LogLevel /*level*/, std::string_view line) override {
     constexpr std::size_t kPrefix = 32;  // the unit and its line
-    // Sources log on threads of their own.
+    // Locked, because sources log on threads of their own.
     const std::lock_guard lock(mutex_);
     std::cerr << "halvoxctl drivers: " << harmlessText(line.substr(std::min(kPrefix, line.size())))
               << std::endl;
@@ -145,8 +145,8 @@ class DriverPrinter {
     IOReportService::Name group;
     if (!request.group.empty()) group = request.group;
     channels_ = service_.IOReportCopyChannelsInGroup(group, std::nullopt, error);
-    // Errors are not tested: a group without channels is noticed by its number of channels, and the
-    // sources log theirs themselves.
+    // Errors are not tested here: the sources log their own errors, and hasChannels() shows whether
+    // there is anything to sample.
     subscription_ = service_.IOReportCreateSubscription(channels_, channels_, error);
   }
 
@@ -232,7 +232,8 @@ ExitStatus showDrivers(const ShowDrivers& request, OutputForm form, std::ostream
   const auto configuration = serviceConfiguration(complain);
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   ErrorLog errorLog;
-  // The sources count what they refuse. Nobody reads the counters of this program.
+  // The sources need a place to count what they refuse, although nobody reads the counters of this
+  // program.
   platform::linux_::CounterStatisticsService statistics;
   platform::linux_::LinuxIOReportService service(
       platform::linux_::makeDriverSources(

@@ -35,7 +35,7 @@ class EventsTest : public StoredEventsFixture {
     store("com.a.third", {{"n", 3}});
     store("com.c.fourth", {{"n", 4}});
   }
-  // The field n of the events shown, in their order.
+  // The field "n" of the events that are shown, in order.
   std::string shown(RecordSelection request) {
     request.database = directory();
     std::ostringstream out;

@@ -43,7 +43,7 @@ std::string_view textOf(const rapidjson::Value& value) {
   return {value.GetString(), value.GetStringLength()};
 }
 
-// Converts parsed JSON to values. After a failure it knows the place.
+// Converts parsed JSON to values. After a failure it knows the place of the error.
 class Converter {
  public:
   bool convert(const rapidjson::Value& json, Dictionary& dictionary) {
@@ -80,7 +80,7 @@ class Converter {
         value = json.GetBool();
         return true;
       case rapidjson::kStringType:
-        // A D-Bus string cannot contain one.
+        // A D-Bus string cannot contain NUL.
         if (textOf(json).find('\0') != std::string_view::npos) {
           return fail("a message cannot hold a NUL character");
         }
@@ -102,8 +102,8 @@ class Converter {
   }
 
   static Value number(const rapidjson::Value& json) {
-    // Signed first: most numbers fit both kinds, and the unsigned one is only for those that are
-    // too large.
+    // The signed kind is tried first: most numbers fit both kinds, and only larger numbers need the
+    // unsigned one.
     if (json.IsInt64()) return json.GetInt64();
     if (json.IsUint64()) return json.GetUint64();
     return json.GetDouble();
@@ -311,7 +311,7 @@ std::string harmlessText(std::string_view text) { return harmless(text, InvalidB
 std::string fieldsOfJson(std::string_view json) {
   rapidjson::Document document;
   document.Parse<kParseFlags>(json.data(), json.size());
-  // Shown as it is: a person can read more from it than from an error.
+  // Another text is shown as it is: a person can read more from it than from an error.
   if (document.HasParseError() || !document.IsObject()) return harmlessText(json);
   std::string fields;
   for (const auto& member : std::as_const(document).GetObject()) {

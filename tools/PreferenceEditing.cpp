@@ -167,7 +167,7 @@ std::string withNewLine(std::string_view text, std::size_t place, const std::str
 
 Result<PreferenceValue> parsePreferenceValue(std::string_view text, ValueForm form) {
   if (!isUtf8(text)) return Failure<>{"VALUE: expected UTF-8 text, found other bytes"};
-  // Tested before parsing: the parser is recursive.
+  // The nesting is tested before parsing, because the parser is recursive.
   if (form == ValueForm::kTomlOrString && !isNestedTooDeep(text)) {
     constexpr std::string_view kKey = "v = ";
     const std::string line = std::string(kKey) + std::string(text);
@@ -210,7 +210,7 @@ Edited withoutPreference(std::string_view text, std::string_view key,
   const std::size_t place = parsed.root().find(key)->first.source().begin
                                 ? offsetOf(text, parsed.root().find(key)->first.source().begin)
                                 : parsed.begin(*old);
-  // Whole lines: a comment beside the value belongs to it and is removed too.
+  // Whole lines are removed: a comment on the line of the value belongs to the value.
   std::string edited(text.substr(0, lineStart(text, place)));
   edited += text.substr(lineEnd(text, parsed.end(*old)));
   return verified(std::move(edited), expected, parsed, key, file);

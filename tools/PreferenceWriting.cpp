@@ -54,7 +54,7 @@ class NewFile {
       if (count < 0) return false;
       text.remove_prefix(static_cast<std::size_t>(count));
     }
-    // Without it, a crash after the rename could leave an empty file.
+    // Without this fsync(), a crash after the rename could leave an empty file.
     return ::fsync(descriptor_.get()) == 0;
   }
   // Renames the file to `target` and replaces a file of that name.
@@ -80,7 +80,7 @@ Result<void> replace(const std::filesystem::path& file, const std::string& text,
                      int directory) {
   NewFile made(file);
   if (!made.write(text, mode) || !made.keepAs(file)) return failure(file, errno);
-  // Without it, a crash could undo the rename.
+  // Without this fsync(), a crash could undo the rename.
   if (::fsync(directory) != 0) return failure(file.parent_path(), errno);
   return {};
 }

@@ -168,8 +168,8 @@ RecordFilter filterOf(const ShowRecords& request) {
     case ShowRecords::Kind::kLink:
       add(store::kLinkSessionID, request.ids);
       add(store::kLinkType, request.types);
-      // The store's filter compares numbers. The stored category has no domain. It must be read
-      // from the payload, record by record.
+      // The store's filter compares numbers, but the stored category has no domain. The domain must
+      // be read from the payload, record by record.
       if (!request.categories.empty()) {
         filter.accepts = [categories = request.categories](const StoredRecord& record) {
           return isOfCategory(record, categories);

@@ -118,7 +118,8 @@ ExitStatus runScript(const ScriptSource& source, const CommonOptions& options, s
   std::string line;
   for (std::size_t number = 1;; ++number) {
     if (source.isPrompting) out << "halvox> ";
-    // Show the answers of a line before the next line is read: on a pipe that may take long.
+    // Show the answers of a line before the next line is read, because reading from a pipe may take
+    // long.
     out << std::flush;
     if (!std::getline(source.lines, line)) break;
 
@@ -139,7 +140,8 @@ ExitStatus runScript(const ScriptSource& source, const CommonOptions& options, s
       status = runLine(*words, runner, options.json, out, errors, prefix, source.lines);
     }
     if (result == ExitStatus::kDone) result = status;
-    // Also with --keep-going: the script's sessions have ended with their connection.
+    // This ends the script even with --keep-going, because its sessions have ended with the
+    // connection.
     if (status == ExitStatus::kNoService) break;
     if (status != ExitStatus::kDone && !source.keepsGoing) break;
   }

@@ -30,7 +30,7 @@ using Reader = UniqueHandle<archive*, archive_read_free>;
 using DiskWriter = UniqueHandle<archive*, archive_write_free>;
 
 constexpr std::size_t kBlock = 64U << 10U;
-// Above what this program writes, which is 64 MiB before compression by default.
+// Above what the service writes, which is 64 MiB before compression by default.
 constexpr std::uint64_t kMostBytes = 256U << 20U;
 constexpr std::size_t kMostEntries = 10'000;
 // Only the signature and the manifest are read as text.
@@ -81,8 +81,8 @@ class Walk {
     if (result == ARCHIVE_EOF) return nullptr;
     if (result != ARCHIVE_OK) return failed(snapshot_, textOf(reader_.get()));
     if (++entries_ > kMostEntries) return failed(snapshot_, "the archive has too many files");
-    // Skipping an entry decompresses it too. Test the sizes in the headers before that.
-    // Each is bounded, so that a size of nearly 2^64 cannot make the sum wrap.
+    // Skipping an entry decompresses it too. Therefore the sizes in the headers are tested first.
+    // Each size is bounded, so that one of nearly 2^64 cannot make the sum wrap.
     announced_ += std::min(static_cast<std::uint64_t>(archive_entry_size(entry)), kMostBytes + 1);
     if (announced_ > kMostBytes) return failed(snapshot_, kTooLarge);
     const char* name = archive_entry_pathname(entry);
@@ -102,7 +102,7 @@ class Walk {
   [[nodiscard]] Result<std::string_view> nextPiece() {
     const la_ssize_t count = archive_read_data(reader_.get(), buffer_.data(), buffer_.size());
     if (count < 0) return failed(snapshot_, textOf(reader_.get()));
-    // Counted too, because the size in a header need not be true.
+    // The unpacked bytes are counted too, because the size in a header need not be true.
     bytes_ += static_cast<std::uint64_t>(count);
     if (bytes_ > kMostBytes) return failed(snapshot_, kTooLarge);
     return std::string_view(buffer_.data(), static_cast<std::size_t>(count));

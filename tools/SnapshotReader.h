@@ -13,8 +13,8 @@ namespace halvox::tools {
 // Returns the contents of the files in `names`, by name. A file that the snapshot lacks is absent
 // from the result. The message of a failure names the file and the reason. Blocks on the disk.
 //
-// A snapshot may come from an untrusted source. It is an error if it is larger than any that this
-// program writes, or if it holds anything but plain files and directories.
+// A snapshot may come from an untrusted source. It is an error if it is larger than any that the
+// service writes, or if it holds anything but plain files and directories.
 [[nodiscard]] platform::linux_::Result<std::map<std::string, std::string>> readSnapshotFiles(
     const std::filesystem::path& snapshot, const std::vector<std::string>& names);
 

@@ -28,10 +28,10 @@ ExitStatus cannotRead(const StoreRun& run, const Failure<StoreError>& failure) {
 
 // Waits for the next records. Returns false when the output is closed.
 bool waitForRecords(int storeDescriptor, int outputDescriptor) {
-  // The output is polled for errors only: while no records come, a pipe without a reader shows in
-  // no other way.
+  // The output is polled for errors only. While no records come, nothing else shows that a pipe has
+  // lost its reader.
   std::array<pollfd, 2> polled{{{storeDescriptor, POLLIN, 0}, {outputDescriptor, 0, 0}}};
-  // Only a signal can make it fail here.
+  // Only a signal can make poll() fail here.
   while (poll(polled.data(), polled.size(), -1) < 0) {
   }
   return (polled[1].revents & (POLLERR | POLLHUP | POLLNVAL)) == 0;
@@ -45,7 +45,7 @@ ExitStatus follow(const StoreRun& run, const std::filesystem::path& directory,
   }
   do {
     const auto delivered = reading.added(follower);
-    // After each batch, so that a reader of the pipe sees records at once.
+    // Flushed after each batch, so that a reader of the pipe sees records at once.
     run.out << std::flush;
     if (!delivered) return cannotRead(run, delivered.error());
   } while (run.out && waitForRecords(follower.descriptor(), run.outputDescriptor));

@@ -36,7 +36,8 @@ struct StoreRun {
   std::ostream& errors;
 };
 
-// Reads and prints records: `all` those of a filter, `added` those that have come since.
+// How records are read and printed: `all` handles those that the store has, `added` those that were
+// added since.
 struct StoreReading {
   using Outcome = platform::linux_::Result<void, platform::linux_::StoreError>;
   std::function<Outcome(platform::linux_::StoreReader&, const platform::linux_::RecordFilter&)> all;

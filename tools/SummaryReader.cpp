@@ -239,7 +239,8 @@ Result<SummaryTotals> readSummary(const std::string& path, const SummaryMessageH
   SummaryHandler summary(handler, totals);
   rapidjson::Reader reader;
   const rapidjson::ParseResult result = reader.Parse<kFlags>(stream, summary);
-  // Before the parser's result: to the parser a read error looks like the end of the file.
+  // Tested before the parser's result, because to the parser a read error looks like the end of the
+  // file.
   if (std::ferror(file) != 0) return Failure<>{"cannot be read"};
   if (!result.IsError()) return totals;
   // Opened again, because the place of an error is counted from the beginning.

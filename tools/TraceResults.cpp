@@ -74,7 +74,7 @@ Failure<> notResults(const std::string& file) {
 
 Result<TraceResults> readTraceResults(const std::string& file) {
   std::ifstream stream(file);
-  // A directory opens but cannot be read.
+  // Opening a directory succeeds. Only reading shows the error.
   if (stream) static_cast<void>(stream.peek());
   if (stream.bad() || !stream.is_open()) return Failure<>{file + ": " + errnoText(errno)};
   rapidjson::IStreamWrapper input(stream);
@@ -85,7 +85,8 @@ Result<TraceResults> readTraceResults(const std::string& file) {
   document.ParseStream<kFlags>(input);
   if (document.HasParseError() || !document.IsObject()) return notResults(file);
   const auto has = [&](const char* name) { return document.HasMember(name); };
-  // Another file of JSON must not pass for results: all that the service writes is required.
+  // Another JSON file must not pass for results. Everything that the service writes must therefore
+  // be there.
   if (!has("product") || !document["product"].IsString() || !has("unit") ||
       !document["unit"].IsString() || textOf(document["unit"]) != "ns" || !has("values") ||
       !document["values"].IsObject()) {

@@ -14,7 +14,7 @@ namespace halvox {
 // One trace: the measurements to make in its events, and their results.
 //
 // The runner owns it. Used by one thread at a time: by the runner's queue while it records, by the
-// stopping thread afterwards. Nothing in it fails.
+// stopping thread afterwards. No operation fails.
 class Trace {
  public:
   // Nanoseconds, or arguments of events, by the name of their measurement. Values of one name are

@@ -33,7 +33,7 @@ class TraceData {
   // Sum and division are in single precision, as the interface demands. Without results it is not a
   // number.
   [[nodiscard]] float getAverageResult() const;
-  // Only intervals count; values of a TracePoint leave it at 0.
+  // The number of measured intervals. The values of a TracePoint leave it at 0.
   [[nodiscard]] std::uint32_t getNumTimesTraced() const { return count_; }
 
  protected:

@@ -16,8 +16,8 @@ struct Discarded {
   std::uint32_t stops = 0;
 };
 
-// The line about stops prints the number of starts. That is part of the interface, and so are the
-// two levels: a single-thread interval logs at debug, the other at default level.
+// The line about stops prints the number of starts. This is part of the interface. The two levels
+// are too: a single-thread interval logs at debug level, an any-thread interval at default level.
 void logDiscarded(platform::LogLevel level, const Discarded& discarded, const std::string& name) {
   platform::LogCategory& category = HVReportingTraceCategory();
   if (discarded.starts != 0) {

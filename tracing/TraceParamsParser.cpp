@@ -118,8 +118,8 @@ class FileReader {
   }
 
   void readTrace(const Dictionary& trace) {
-    // The first trace that has a name gives the record's name; likewise the first signpost its
-    // type.
+    // The first trace that has a name gives the record its name. The first signpost gives the
+    // record its type.
     if (params_.name.empty()) {
       params_.name = textOf(trace, TraceDataDescription);
       if (params_.name.empty()) listener_.onError("Description not found in the plist file");

@@ -22,7 +22,8 @@ constexpr std::string_view kResultsFileName = "tracing_results.ssj";
 constexpr std::string_view kProductName = "HVReporting";
 constexpr std::uint32_t kResultsVersion = 4;
 constexpr std::uint32_t kNoFlags = 0;
-// The readers of these files expect it. The storage root's own permissions keep others out.
+// The readers of these files expect these permissions. Other users are kept out by the permissions
+// of the storage root.
 constexpr std::uint32_t kDirectoryPermissions = 0777;
 constexpr std::string_view kQueueLabel = "Tracing Queue";
 // The range of identifiers that is recorded: what the audio frameworks emit.
@@ -65,7 +66,7 @@ class TraceRunner::Recording {
     const int range = platform::ktrace().ktrace_events_range(
         session_, kFirstIdentifier, kLastIdentifier,
         [this](const platform::trace_point& event) { events_.push_back(event); });
-    // Not fatal: the recording starts anyway and records nothing; this is required.
+    // This error is not fatal: the recording starts anyway and records nothing. This is required.
     if (range != 0) kLog.error("Could not set up ktrace range, error: ", range);
   }
   void startTracing(const std::shared_ptr<platform::DispatchQueue>& queue) {
@@ -97,16 +98,16 @@ class TraceRunner::Recording {
 
 TraceRunner::TraceRunner()
     : queue_(platform::dispatch().createSerialQueue(
-          // Not of a lower quality: a stop waits for it on the reporting queue.
+          // The quality is not lower, because a stop waits for this queue on the reporting queue.
           kQueueLabel, platform::QualityOfService::kUserInteractive,
           platform::QueueThreading::kOwnThread)),
       started_(platform::dispatch().createSemaphore(0)),
       completions_(std::make_shared<Completions>()) {}
 
-// A runner can be destroyed while it records: its session was replaced under its ID without a stop,
-// or is not a test session any more when it stops. The queue ends the recordings, after starts that
-// still wait for the tracer. The destructor itself does not wait, because it runs on the reporting
-// queue.
+// A runner can be destroyed while it records. This happens if its session was replaced by one with
+// the same ID without a stop, or was no longer a test session when it stopped. The queue ends the
+// recordings, after starts that still wait for the tracer. The destructor itself does not wait,
+// because it runs on the reporting queue.
 TraceRunner::~TraceRunner() {
   if (state_ != State::kRecording) return;
   for (const auto& recording : recordings_) {
@@ -149,10 +150,11 @@ void TraceRunner::runTraces() {
     kLog.info("Setting up tracing: ", trace.name());
     recording->setupTracing();
     kLog.info("Starting tracing: ", trace.name());
-    // Subscribed before the start, which begins to deliver at once.
+    // The recording is subscribed before it starts, because a start begins to deliver events at
+    // once.
     recording->subscribe();
-    // On the queue, because the tracer may take seconds to start and every client waits for the
-    // thread that starts sessions.
+    // Started on the queue, because the tracer may take seconds to start and every client waits for
+    // the thread that starts sessions.
     queue_->async(platform::JobWeight::kMayBlock, [recording, queue = queue_, started = started_] {
       recording->startTracing(queue);
       started->signal();
@@ -163,7 +165,7 @@ void TraceRunner::runTraces() {
 void TraceRunner::stopTracingandProcessResults() {
   if (state_ != State::kRecording) return;
   state_ = State::kFinished;
-  // An error of the start must be logged before the lines of the stop.
+  // Waits for every start: an error of a start must be logged before the lines of the stop.
   for (const auto& recording : recordings_) {
     if (recording->trace().isKernelTrace()) started_->wait();
   }
@@ -213,7 +215,8 @@ void TraceRunner::writeScoresheet() const {
   kLog.info("Completed trace....In write perf data.... ", results_.size());
   if (const auto error = platform::files().createDirectory(HVReportingTracingLogsDirectory,
                                                            kDirectoryPermissions)) {
-    // Not fatal by itself: opening the file fails next if the directory is really missing.
+    // This error is not fatal by itself: if the directory is really missing, opening the file fails
+    // next.
     kLog.error("can't create logging directory at ", HVReportingTracingLogsDirectory, ": ",
                error->description);
   }

@@ -12,7 +12,7 @@
 
 namespace halvox {
 
-// Fixed by the interface; the platform puts its storage root in front of it.
+// The interface fixes this path. The platform puts its storage root in front of it.
 inline constexpr std::string_view HVReportingTracingLogsDirectory =
     "/private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Traces";
 

@@ -42,7 +42,8 @@ class Connection {
   }
 
  private:
-  // Agrees to everything but file descriptors. Returns how much of the input belonged to it.
+  // Agrees to everything but file descriptors. Returns how much of the input belonged to the
+  // handshake.
   std::size_t authenticate() {
     std::size_t used = 0;
     while (!authenticated_) {

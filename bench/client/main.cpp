@@ -1,4 +1,4 @@
-// Measures the client library beside what replaces it: a hand-written encoder with batched writes,
+// Compares the client library with two alternatives: a hand-written encoder with batched writes,
 // and sd-bus. Each measurement runs in a process of its own, so that getrusage() counts that client
 // alone. The kinds take turns in every round. All use one server that does the least for a request.
 
@@ -145,7 +145,8 @@ Values pipelineLibrary(const std::string& socketPath, std::int64_t count, Use us
     if (halvox_client_send(client.get(), kReporter, message.get(), 4, 18) != HALVOX_OK) {
       throw std::runtime_error("a message was dropped");
     }
-    // As many as keep the library busy, but not so many that their memory leaves the cache.
+    // Enough messages wait to keep the library busy, but not so many that their memory leaves the
+    // cache.
     while (number % 64 == 0 && pending(client.get()) > 4 * kWindow) {
       std::this_thread::sleep_for(std::chrono::microseconds(100));
     }
@@ -166,7 +167,7 @@ Values pipelineRaw(const std::string& socketPath, std::int64_t count) {
   return {(cpuMicroseconds() - before) / messages, messages / seconds};
 }
 
-// The least that the machine interferes with a caller, as far as this process may say so.
+// Reduces the interference of the machine with a caller, if this process may raise its priority.
 void raisePriority() {
   sched_param parameters{};
   parameters.sched_priority = 10;

@@ -53,7 +53,8 @@ void watch(int poller, int fd, int operation, std::uint32_t events) {
 // Handles what has arrived. Returns false when the connection has ended.
 bool serve(int poller, int fd, sd_bus* bus) {
   int result = 0;
-  // Until nothing is left: sd-bus may hold complete messages that epoll does not report again.
+  // Continues until nothing is left, because sd-bus may hold complete messages that epoll does not
+  // report again.
   while ((result = sd_bus_process(bus, nullptr)) > 0) {
   }
   if (result < 0) return false;

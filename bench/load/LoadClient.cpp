@@ -131,7 +131,7 @@ void LoadClient::createSessions(std::int64_t first, std::int64_t count) {
 
 void LoadClient::sendOne(std::int64_t number, const MessageShape& shape) {
   const Message message = newSendMessage(bus_, reporter_, number, shape);
-  // Without a time-out: a slow answer is to be measured.
+  // The call has no time-out, because slow answers are measured too.
   check(sd_bus_call_async(bus_, nullptr, message.get(), countAnswer, &answered_, UINT64_MAX),
         "send");
 }
@@ -165,7 +165,7 @@ std::vector<double> LoadClient::ping(int count, const MessageShape& shape) {
     check(sd_bus_call(bus_, message.get(), 0, nullptr, &reply), "send");
     seconds.push_back(std::chrono::duration<double>(Clock::now() - begin).count());
     sd_bus_message_unref(reply);
-    // After the answer, so that at most one request is on its way.
+    // Sleeps only after the answer has come, so that at most one request is on its way.
     std::this_thread::sleep_until(begin + std::chrono::milliseconds(1));
   }
   return seconds;

@@ -65,7 +65,7 @@ std::vector<double> pingUnderLoad(const Server& server, const LoadOptions& optio
   for (int number = 0; number < options.clients; ++number) {
     busy.emplace_back([&server, &options, &stopping, number] {
       MessageShape repeated = options.shape;
-      // Repeated, so that no history grows while the other client is measured.
+      // The messages are repeated, so that no history grows while the other client is measured.
       repeated.content = Content::kRepeated;
       const auto client = server.client(100 + number);
       while (!stopping) client->pipeline(1000, options.window, repeated);
@@ -173,7 +173,8 @@ void measureMemory(const LoadOptions& options, std::vector<Measurement>& results
   const Server server(options.programs, ServerKind::kUnwanted);
   const auto client = server.client(1);
   client->pipeline(5000, options.window, options.shape);
-  // After a warm-up: the first messages make the pools and tables that later ones use.
+  // Measured after a warm-up, because the first messages make the pools and tables that later ones
+  // use.
   const long before = server.process().residentKib();
   client->pipeline(options.messages, options.window, options.shape);
   const auto grown = static_cast<double>(server.process().residentKib() - before) * 1024;
@@ -203,7 +204,7 @@ void measureGrowth(const LoadOptions& options, std::vector<Measurement>& results
           idle.push_back(server.client(10'000 + number));
         }
       }));
-  // Their connections would count in the next measurement.
+  // Otherwise their connections would count in the next measurement.
   idle.clear();
   add("with 1,000,000 messages of history",
       serverMicrosAfter(options, [&options](const Server&, LoadClient& client) {

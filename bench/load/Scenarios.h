@@ -23,7 +23,7 @@ struct LoadOptions {
 
 // Messages a second, and the CPU time of the service and of its client for each.
 void measureThroughput(const LoadOptions& options, std::vector<Measurement>& results);
-// The time to an answer, of a client alone and of one beside busy clients.
+// The time to an answer, for a client alone and for a client while others are busy.
 void measureLatency(const LoadOptions& options, std::vector<Measurement>& results);
 // Resident memory of the service, and the growth for each message in a history.
 void measureMemory(const LoadOptions& options, std::vector<Measurement>& results);

@@ -19,7 +19,8 @@ class MainLoop::Impl {
       pw_deinit();
       throw std::runtime_error("cannot create the event loop of PipeWire's library");
     }
-    // This blocks the signals, also for threads that are made later. They reach the loop instead.
+    // The library blocks the signals, also for threads that are made later. The signals reach the
+    // loop instead.
     for (const int number : {SIGTERM, SIGINT}) {
       pw_loop_add_signal(handle(), number, &Impl::onSignal, this);
     }

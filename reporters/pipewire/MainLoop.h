@@ -8,10 +8,10 @@ struct pw_loop;
 namespace halvox::pipewire_reporter {
 
 // The event loop of the reporter. Handles PipeWire's events, SIGTERM and SIGINT, and calls that
-// other threads request; sleeps between them without a timer.
-// Make one in a process, and make it before any other thread. The constructor blocks the two
-// signals, and later threads inherit that. The kernel may deliver a signal to an earlier thread,
-// and the process would end without stopping its sessions.
+// other threads request; sleeps between them without a timer. Make one in a process, and make it
+// before any other thread. The constructor blocks the two signals for its own thread and, by
+// inheritance, for later threads. The kernel could deliver a signal to an earlier thread, and the
+// process would then end without stopping its sessions.
 class MainLoop {
  public:
   // Throws std::runtime_error when the loop cannot be made, for example without free descriptors.

@@ -33,7 +33,7 @@ inline constexpr const char* kDevicesKey = "active_devices";
 inline constexpr const char* kVolumeKey = "RQSessionVolume";
 inline constexpr const char* kPlayingKey = "RQSessionVolumePlayingState";
 inline constexpr const char* kVolumeProcessKey = "RQSessionVolumeOperationProcess";
-// The stream's object.serial. In every message, to distinguish the streams of one application.
+// The stream's object.serial. Every message has it, to distinguish the streams of one application.
 inline constexpr const char* kSerialKey = "object_serial";
 // The number of the stream's run, from 1. Without it the service would suppress a second Start as a
 // repeat of the first.

@@ -10,7 +10,8 @@ void RouteGraph::addDevice(GlobalID id, Route::Device device) { devices_[id] = s
 void RouteGraph::removeDevice(GlobalID id) { devices_.erase(id); }
 
 void RouteGraph::addLink(GlobalID id, Link link) {
-  // A link that is announced twice must not be counted twice: its removal comes once.
+  // A link that is announced twice must not be counted twice, because its removal is announced
+  // once.
   if (!links_.emplace(id, link).second) {
     return;
   }

@@ -26,8 +26,8 @@ StreamBinding::StreamBinding(pw_registry* registry, std::uint32_t id, StreamList
 
 void StreamBinding::onInfo(void* data, const pw_node_info* info) {
   auto* self = static_cast<StreamBinding*>(data);
-  // Properties before the state: the tracker learns of a stream by its properties, and ignores the
-  // state of streams that it does not know.
+  // The properties are passed before the state. The tracker learns of a stream by its properties,
+  // and ignores the state of streams that it does not know.
   if ((info->change_mask & PW_NODE_CHANGE_MASK_PROPS) != 0) {
     self->properties_ = makeProperties(info->props);
     self->listener_.onStreamProperties(self->id_, self->properties_);

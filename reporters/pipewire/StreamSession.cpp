@@ -137,8 +137,8 @@ void StreamSession::restate() {
   if (!started_) {
     return;
   }
-  // The service has lost its history with its sessions. It needs even a volume that has not
-  // changed.
+  // The service has lost its sessions and their histories. It needs the volume even if the volume
+  // has not changed.
   sentVolume_.reset();
   sendFormat();
   sendRoute();
@@ -158,7 +158,7 @@ void StreamSession::beginRun() {
 }
 
 void StreamSession::endRun() {
-  // Before the Stop: what was lost belongs to this run.
+  // Sent before the Stop, because what was lost belongs to this run.
   if (const auto lost = xruns_.takeRest()) {
     sendXrun(*lost);
   }
@@ -209,8 +209,8 @@ void StreamSession::sendXrun(XrunMeter::Seconds lost) {
 void StreamSession::sendRun(EventType type) { send({{kRunKey, run_}}, category(), type); }
 
 void StreamSession::send(platform::Dictionary message, Category category, EventType type) {
-  // An event in the store has the application but not the session: the serial distinguishes its
-  // streams.
+  // An event in the store names the application but not the session. The serial distinguishes the
+  // streams of the application.
   message.set(kSerialKey, identity_.serial);
   client_.send(identity_.reporterID, message, category, type);
 }

@@ -110,7 +110,8 @@ void StreamTracker::cycleEnded(XrunMeter::Time time, XrunMeter::Seconds length,
       session->addXrun(time, length);
     }
   }
-  // Every cycle, of any node, also sends reports that are due by now. This saves a timer.
+  // At the end of every cycle, whichever nodes missed it, all reports that are due are sent. This
+  // saves a timer.
   for (auto& [id, entry] : streams_) {
     entry.session->reportXruns(time);
   }

@@ -81,8 +81,8 @@ class StreamWatcher::Impl final : public StreamListener, private pipewire::Serve
       throw std::runtime_error(
           fmt::format("cannot set up PipeWire's library: {}", platform::linux_::errnoText(errno)));
     }
-    // Loaded before the connection: the library must know the profiler's interface when it is
-    // bound.
+    // Loaded before the connection, because the library must know the profiler's interface when the
+    // profiler is bound.
     if (options_.xruns && !pipewire::loadProfilerModule(context_.get())) {
       options_.xruns = false;
       options_.log("xruns are not reported: PipeWire's profiler module is not installed");
@@ -194,8 +194,8 @@ void StreamWatcher::Impl::addLink(GlobalID id, const Properties& properties) {
                           .input = idProperty(properties, PW_KEY_LINK_INPUT_NODE)});
 }
 
-// Follows the profiler only while there are streams: it wakes this process. Must not be called from
-// a callback of the profiler, whose binding it may destroy.
+// Follows the profiler only while there are streams, because the profiler wakes this process. Must
+// not be called from a callback of the profiler, whose binding this function may destroy.
 void StreamWatcher::Impl::updateProfiler() {
   if (!profilerID_.has_value() || streams_.empty()) {
     profiler_.reset();

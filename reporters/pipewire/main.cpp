@@ -76,8 +76,8 @@ bool completeFromConfiguration(Arguments& arguments) {
 }
 
 void run(const Arguments& arguments) {
-  // Before the client, which has a thread: the loop blocks the signals, and later threads inherit
-  // that.
+  // Made before the client, which has a thread: the loop blocks the signals, and only later threads
+  // inherit this.
   MainLoop loop;
   halvox::client::HalvoxClient client({.socketPath = arguments.socket});
   HalvoxReportingClient handOver(client);

@@ -7,7 +7,7 @@ concatenation of sources that have the same compiler options. The text is concat
 because some checks look only at the main file.
 
 - A unit without a finding proves that its sources have none. After a finding, or an error that only
-  the concatenation has, the sources of the unit are read one by one, and what that reports counts.
+  the concatenation has, the sources of the unit are read one by one, and only these findings count.
 - source_units.py decides which sources share a unit. What it misses, such as two classes of one name
   in headers of libraries, makes a unit that does not compile, which only costs time.
 - A use in one source hides an unused using-declaration in another. Sources with using-declarations
@@ -88,7 +88,7 @@ def tidy(database, path, *arguments):
         ["clang-tidy", "-p", str(database), "--quiet", *arguments, str(path)],
         stdout=subprocess.PIPE, stderr=subprocess.PIPE, text=True, check=False,
     )
-    # It succeeds, too, when it skips a file that has no compile command.
+    # clang-tidy also succeeds when it skips a file that has no compile command.
     if run.returncode == 0 and "Compile command not found" not in run.stderr:
         return None
     return run.stdout if run.stdout.strip() else run.stdout + run.stderr

@@ -51,7 +51,7 @@ halvox_wait_for_start() {
 # Starts a process in the background: halvox_start NAME LOG COMMAND...
 # Sets HALVOX_PID. The process gets its own process group, so that a Ctrl-C reaches only the script,
 # which then stops everything in order. It ends if the script is killed. Do not call this in a
-# subshell: the process would belong to that.
+# subshell: the process would belong to the subshell.
 halvox_start() {
   local name=$1 log=$2
   shift 2
@@ -123,7 +123,7 @@ halvox_show_logs() {
 halvox_clean_up() {
   local status=$?
   trap '' INT TERM HUP
-  # 130 and above: a signal such as Ctrl-C ended the script, which is not a failure.
+  # 129 and above: a signal such as Ctrl-C ended the script, which is not a failure.
   if ((status != 0 && status < 129)) && [ -n "$HALVOX_SCRATCH" ]; then
     halvox_show_logs
   fi

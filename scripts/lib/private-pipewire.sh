@@ -96,8 +96,8 @@ halvox_audio_enter() {
 
 halvox_audio_socket_exists() { [ -S "$1" ]; }
 
-# Whether WirePlumber has found the sink and made it the default: from then on it links streams to
-# it.
+# Whether WirePlumber has found the sink and made it the default. From then on WirePlumber links
+# streams to the sink.
 halvox_audio_has_default_sink() { pw-dump | grep -q '"default.audio.sink"'; }
 
 halvox_audio_start_servers() {

@@ -47,7 +47,7 @@ void read(std::span<const std::byte> bytes) {
 }  // namespace halvox::zubmetrics
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  // In a block of their own, so that sanitizers see their exact end.
+  // The bytes are copied into a block of their own, so that sanitizers see their exact end.
   const std::vector<std::uint8_t> bytes(data, data + size);
   halvox::zubmetrics::read(std::as_bytes(std::span(bytes)));
   return 0;

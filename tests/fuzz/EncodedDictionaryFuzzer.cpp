@@ -1,6 +1,7 @@
 // Carries out a random program of changes of dictionaries and arrays in their encoded form, and the
-// same changes of ordinary values. Each message must then be the one that is encoded from the
-// ordinary values, byte for byte, the one that is built anew, and the one that the service decodes.
+// same changes of ordinary values. The frame of each message must then equal, byte for byte, the
+// frame that is encoded from the ordinary values and that of a message that is built anew. The
+// service must decode the ordinary values from it.
 
 #include <array>
 #include <cstddef>
@@ -28,8 +29,8 @@ using platform::Array;
 using platform::NumberKind;
 using platform::ValueKind;
 
-// Containers can be stored in themselves, which doubles them. Larger ones make the fuzzer slow and
-// show nothing more.
+// A container can be stored in itself, which doubles its size. Larger containers than this make the
+// fuzzer slow and show nothing more.
 constexpr std::size_t kMostBytes = 1024;
 constexpr std::size_t kSlots = 3;
 
@@ -58,7 +59,8 @@ class Input {
     std::memcpy(&number, bytes.data(), sizeof number);
     return number;
   }
-  // Short texts are repeated: keys must meet again for a change to replace a value.
+  // The texts are few and therefore repeat: a change replaces a value only if its key is already
+  // there.
   std::string text() {
     const std::uint8_t length = byte();
     if (length < 128) return std::string(length % 20, static_cast<char>('a' + length % 3));
@@ -77,8 +79,8 @@ std::span<const std::byte> bytesOf(const std::string& text) {
   return std::as_bytes(std::span(text));
 }
 
-// Puts one value of each type into a container. `put` takes it as it is given to the encoded
-// container; the result is the same value for the ordinary one.
+// Reads a value of this type from the input. Calls `put` with it in the form that encoded
+// containers take, and returns it in the form that ordinary containers take.
 template <typename Put>
 Value putScalar(Input& input, std::size_t type, const Put& put) {
   const auto number = [&](auto value) {

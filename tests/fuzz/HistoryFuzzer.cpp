@@ -98,7 +98,7 @@ void readMessages(std::span<const std::byte> bytes) {
 }  // namespace halvox
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-  // In a block of its own, so that sanitizers see its exact end.
+  // The input is copied into a block of its own, so that sanitizers see its exact end.
   const std::vector<std::uint8_t> block(data, data + size);
   const auto bytes = std::as_bytes(std::span(block));
   halvox::readValues(bytes);

@@ -68,7 +68,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     if (!read(writer.finish(packing), data[0], second, nullptr)) std::abort();
     if (second.size() != first.size()) std::abort();
     for (std::size_t index = 0; index < first.size(); ++index) {
-      // A NaN is not equal to itself; its text is not compared.
+      // A NaN is not equal to itself. Two NaN count as the same time.
       const bool isSameTime =
           first[index].time == second[index].time ||
           (first[index].time != first[index].time && second[index].time != second[index].time);

@@ -81,7 +81,7 @@ void decode(const Frame& frame) {
   checkCached(frame, error, arguments);
 }
 
-// The same for headers.
+// What earlier inputs left in the caches must not change how a header is read either.
 void checkCachedHeader(std::span<const std::byte> bytes,
                        const std::variant<Frame, WireError>& expected) {
   static HeaderCache cache;
@@ -128,7 +128,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   using namespace halvox::platform::linux_::dbus;
   if (size == 0) return 0;
   const std::uint8_t mode = data[0];
-  // The rest in a block of its own, so that sanitizers see its exact end.
+  // The rest is copied into a block of its own, so that sanitizers see its exact end.
   const std::vector<std::uint8_t> rest(data + 1, data + size);
   const auto bytes = std::as_bytes(std::span(rest));
   if (mode % 16 == kSignatures.size()) {

@@ -89,7 +89,7 @@ def flat(places):
 
 
 def edits(text):
-    """Of a function with that body: the kind, the original and the replacement of each mutant."""
+    """The kind, the original and the replacement of each mutant of a function with that body."""
     return {(one.kind, one.original, one.replacement)
             for one in flat(mutants_of("a.cpp", f"void f() {{\n{text}\n}}\n"))}
 

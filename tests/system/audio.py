@@ -76,7 +76,7 @@ class Audio:
         return path
 
     def run(self, *command):
-        # In the scratch directory, because pw-profiler leaves plots in its working directory.
+        # Runs in the scratch directory, because pw-profiler leaves plots in its working directory.
         return subprocess.Popen(command, env=self.environment, cwd=self.directory,
                                 stdin=subprocess.DEVNULL, stdout=subprocess.DEVNULL)
 

@@ -32,7 +32,7 @@ BUS_NAME = "com.tarno.halvox.reporting"
 OBJECT = "/com/tarno/halvox/reporting"
 UPTIME_EVENT = "com.tarno.halvox.hvreportingclientuptime"
 INTERFACE = "com.tarno.halvox.HVReportingServiceProtocol"
-# Whatever ends a test, even a time-out that kills it, ends what the test has started.
+# A program that a test starts ends with the test, even if a time-out kills the test.
 WITH_US = ["setpriv", "--pdeathsig", "KILL", "--"]
 # Seconds. On a slow machine a sanitized service needs most of a minute to read a million events back.
 DEADLINE = 240.0 if os.environ.get("HALVOX_SANITIZE") else 30.0

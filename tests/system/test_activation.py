@@ -115,7 +115,7 @@ class Activation(unittest.TestCase):
             self.assertEqual(call.wait(), [])
 
     def test_a_program_started_by_another_bus_serves_its_socket_all_the_same(self):
-        """As from a terminal that a bus has started, when that bus has ended or the name is taken."""
+        """Like a service in a terminal that a bus started: the bus may have ended, or the name be taken."""
         environment = {"DBUS_STARTER_ADDRESS": f"unix:path={self.directory}/no-bus",
                        "DBUS_STARTER_BUS_TYPE": "session"}
         with Service(environment=environment) as service:

@@ -26,7 +26,8 @@ def counters(service, piece):
     """The counters of a piece of the running service, by name."""
     said = len(service.log())
     service.process.send_signal(signal.SIGUSR1)
-    # Pieces are logged in the order of their names, so these are the last lines.
+    # Pieces are logged in the order of their names. The awaited line comes after those of the
+    # pieces that are read.
     wait_for("the counters", lambda: "counted snapshots, stored: " in service.log()[said:])
     return {name: int(value) for name, value
             in re.findall(rf"counted {piece}, (.*): (\d+)$", service.log()[said:], re.MULTILINE)}

@@ -1,4 +1,4 @@
-"""A flood of messages that wait for their second affects only the client that sent it."""
+"""A flood of single messages, which wait for one second, affects only the client that sent it."""
 
 import unittest
 

@@ -149,7 +149,8 @@ class LinkSessions(LinkTest):
                 if "a" in payload]
         self.assertEqual(rows, [
             (7, harness.START, "first"), (7, harness.START, "same"), (7, SUMMARY, "first,same"),
-            # Neither compared with the last message of the previous run nor summed up with it.
+            # The first message of a run is neither compared with the last message of the previous
+            # run nor summed up with it.
             (7, harness.START, "same"), (7, harness.START, "second"), (7, SUMMARY, "same,second")])
 
 

@@ -121,7 +121,7 @@ class ModulesTest(unittest.TestCase):
 
 
 class MissingModulesTest(unittest.TestCase):
-    """The service without any module, as a package of it alone would have it."""
+    """The service without any module, as a package without the optional parts installs it."""
 
     def setUp(self):
         self.directory = Path(tempfile.mkdtemp(prefix="halvox-modules-"))

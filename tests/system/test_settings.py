@@ -195,8 +195,8 @@ class Settings(unittest.TestCase):
                 self.assertEqual(len(re.findall(r"feature \d+ changes", self.log_since(mark))), 2)
 
     def save_at_once(self, save):
-        """Saves, again if a delay made two changes of one save. Returns the end of the log before
-        the save."""
+        """Saves a file, and again if a delay made two changes of one save. Returns the end of the
+        log before the save."""
         for number in range(20):
             mark = self.mark()
             begin = time.monotonic()
@@ -244,7 +244,8 @@ class Settings(unittest.TestCase):
 
     def test_a_directory_in_the_place_of_a_preference_file(self):
         def replace():
-            # In one step: without a file, the preference would be removed.
+            # The exchange is one step, because the preference would count as removed while there is
+            # no file.
             directory = Path(tempfile.mkdtemp(dir=self.service.directory))
             exchange(self.file, directory)
         self.assert_told_and_mended(replace, "expected a regular file")

@@ -38,7 +38,8 @@ def counters(service):
     """The counters of the running service's snapshots, by name."""
     said = len(service.log())
     service.process.send_signal(signal.SIGUSR1)
-    # Pieces are logged in the order of their names, so these are the last lines.
+    # Pieces are logged in the order of their names. The awaited line comes after those of the
+    # pieces that are read.
     wait_for("the counters", lambda: "counted snapshots, stored: " in service.log()[said:])
     return {name: int(value) for name, value
             in re.findall(r"counted diagnostics, (.+): (\d+)$", service.log()[said:], re.MULTILINE)}
@@ -169,8 +170,8 @@ class Snapshots(unittest.TestCase):
                 haptics = HapticsClient(service)
                 for seconds in range(20):
                     haptics.send(report(seconds))
-                # If these had requested a snapshot, the request would have come before the last
-                # answer, and the archive would exist at the latest when the service has ended.
+                # If these reports had requested a snapshot, the request would have come before the
+                # last answer. Its archive would exist at the latest when the service has ended.
                 self.assertEqual(service.stop(), 0)
                 self.assertEqual(snapshots(service), [])
                 self.assertNotIn("snapshot", service.log())

@@ -50,7 +50,7 @@ class MarkedService(Service):
         wait_for("the trace points", lambda: "halvox:kdebug" in self.lttng("list", "-u").stdout)
         for attempt in range(10):
             # Now and then the tracer's daemon declares an event before its stream, and nothing can
-            # read such a trace. It shows as soon as the trace has been started.
+            # read such a trace. The fault shows as soon as the trace has been started.
             self.trace = self.directory / f"trace{attempt}"
             self.must("create", "marks", "-o", self.trace)
             self.must("enable-event", "-u", "halvox:kdebug")

@@ -24,7 +24,7 @@ ExitStatus runFile(const RunScript& script, const CommonOptions& options,
                      streams.output, streams.errors);
   }
   std::ifstream file(script.file);
-  // A directory opens but cannot be read.
+  // Opening a directory succeeds. Only reading shows the error.
   if (file) static_cast<void>(file.peek());
   if (file.bad() || !file.is_open()) {
     return Complaint("run", options.form(), streams.output, streams.errors)(

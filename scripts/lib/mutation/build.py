@@ -223,7 +223,7 @@ class Program:
         seconds = math.ceil(limit)
         command = ["prlimit", f"--cpu={seconds}", f"--as={MEMORY_LIMIT}", "--core=0", "--",
                    str(path), "--gtest_fail_fast", f"--gtest_filter={tests}"]
-        # In the directory of the build, to which the paths that tests read may be relative.
+        # Runs in the build directory, because tests may read paths relative to it.
         return run(command, self._build, WAIT_FACTOR * limit, {**os.environ, **_TEST_ENVIRONMENT})
 
     def fails(self, path, slow=False):
