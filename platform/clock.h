@@ -6,7 +6,7 @@
 
 namespace halvox::platform {
 
-// A point in time in the notation of one time zone.
+// A point in time as a calendar date and time of day in one time zone.
 struct LocalTime {
   int year = 1970;
   int month = 1;  // from 1
@@ -18,20 +18,20 @@ struct LocalTime {
   friend bool operator==(const LocalTime&, const LocalTime&) = default;
 };
 
-// The clocks of the platform. Everything that depends on time reads it here, so that tests can set
-// it.
+// The clocks of the platform. All code that depends on time reads it from this service, so that
+// tests can set it.
 //
 // Any thread may call; nothing blocks and nothing fails. The composition root owns the service.
 class ClockService {
  public:
   virtual ~ClockService() = default;
 
-  // The wall clock. It can jump in both directions while the process runs; measure intervals with
-  // one of the uptimes.
+  // The wall clock. It can jump in both directions while the process runs. Measure intervals with
+  // one of the uptimes instead.
   [[nodiscard]] virtual Date currentDate() const = 0;
-  // A date in the time zone of the platform. A date outside the range of the calendar, or a NaN,
-  // results in the default LocalTime: dates come from clients, and making a name from a date must
-  // not fail.
+  // Converts a date to the time zone of the platform. Returns the default LocalTime for a NaN and
+  // for a date outside the range of the calendar, because dates come from clients and making a file
+  // name from one must not fail.
   [[nodiscard]] virtual LocalTime localTime(Date date) const = 0;
   // Seconds since the system started, including time in which it was suspended.
   [[nodiscard]] virtual std::chrono::duration<double> systemUptime() const = 0;

@@ -28,8 +28,8 @@ struct Error {
 // Answers one request with an error or with the value that the method returns.
 //
 // It may be called from any thread, at any time, or never. It does not block. It does nothing after
-// the client has disconnected. The wire has room for one answer: a second call is dropped and
-// logged at debug level.
+// the client has disconnected. The protocol allows one answer to a request. A second call is
+// therefore dropped and logged at debug level.
 using ReplyCallback = std::function<void(const std::optional<Error>&, const Value&)>;
 
 // What the service holds because of one client's requests: the content of its sessions, and
@@ -40,15 +40,15 @@ struct ResourceUse {
   std::uint64_t sessions = 0;
 };
 
-// The object at this end of a connection, which a client's requests reach.
+// The object that receives the requests of one client. A connection exports one.
 //
-// Shared: the connection holds it until it is invalidated, and each job that it queued holds it
-// until the job has run.
+// Shared: the connection holds the object until the connection is invalidated. Each job that the
+// object has queued holds it until the job has run.
 class ExportedObject {
  public:
   virtual ~ExportedObject() = default;
-  // Ends a series of calls of InterfaceMethod::post: no further request has arrived. Called on the
-  // connection's thread.
+  // The connection calls this on its thread after a series of calls of InterfaceMethod::post, when
+  // it delivers no further request in this turn of the event loop.
   virtual void endOfRequests() {}
   // What the service holds for this client now. Called on the connection's thread; never blocks.
   [[nodiscard]] virtual ResourceUse resourceUse() const { return {}; }
@@ -56,8 +56,8 @@ class ExportedObject {
 
 // Stands for one request that has not been carried out. The job that carries the request out holds
 // it; when the last copy is destroyed, the request counts as carried out, whether it was answered
-// or not. A connection is read from only while few of its tokens exist. This limits the work that a
-// client can have pending.
+// or not. The connection reads from its client only while few of its tokens exist, which limits the
+// work that a client can have pending.
 using RequestToken = std::shared_ptr<void>;
 
 // What a request has besides its arguments.
@@ -74,7 +74,7 @@ struct Invocation {
   RequestContext context;
 };
 
-// What an open request is to the connection that has read it.
+// What a connection must know about one of its open requests to answer it and to count it.
 struct RequestMark {
   std::uint32_t serial = 0;
   bool wantsAnswer = false;
@@ -83,20 +83,21 @@ struct RequestMark {
   std::size_t bytes = 0;
 };
 
-// The part of a connection that outlives it: where its requests are answered. Shared by the
-// connection and its open requests. Any thread may call.
+// Answers the requests of one connection. Outlives the connection, because some of its requests may
+// still be open when it ends. Shared by the connection and its open requests. Any thread may call.
 class RequestSource {
  public:
   virtual ~RequestSource() = default;
   // Answers the request, like a ReplyCallback.
   virtual void answer(const RequestMark& mark, const std::optional<Error>& error,
                       const Value& value) = 0;
-  // The request has been carried out, like the end of a RequestToken.
+  // Counts the request as carried out, like the destruction of the last copy of a RequestToken.
   virtual void carriedOut(const RequestMark& mark) = 0;
 };
 
 // A ReplyCallback and a RequestToken in one, which needs no allocation. For the most frequent
-// requests. The request counts as open as long as this exists. Belongs to one thread at a time.
+// requests. The request counts as open as long as this object exists. Belongs to one thread at a
+// time.
 class PostedRequest {
  public:
   PostedRequest() = default;
@@ -125,10 +126,10 @@ class PostedRequest {
   RequestMark mark_;
 };
 
-// Whether a request can make the service hold more for its client. While a client is over its limit
-// of bytes, requests that may hold more are refused and the others are not, so that the client can
-// always stop and destroy sessions. Requests that make a session are also refused while the client
-// has too many of these.
+// Whether a request can make the service hold more memory for its client. While a client is over
+// its limit of bytes, the connection refuses its requests with kMayHoldMore and kMakesSession. It
+// accepts those with kHoldsNoMore, so that the client can always stop and destroy sessions. It also
+// refuses kMakesSession while the client has too many sessions.
 enum class MethodEffect : std::uint8_t { kMayHoldMore, kHoldsNoMore, kMakesSession };
 
 // Who may make a request: anyone who can connect, or only the owner, which is root or the user that
@@ -152,17 +153,18 @@ struct InterfaceMethod {
   std::size_t (*reporterIDs)(std::span<const Value> arguments) = nullptr;
   MethodAccess access = MethodAccess::kAnybody;
   // The number of entries that the object adds to a dictionary among the arguments. The connection
-  // makes the dictionary with room for them: it then stays in one block of memory.
+  // allocates memory for them when it decodes the dictionary, because adding them then needs no
+  // second block of memory.
   std::size_t addedEntries = 0;
-  // If it is not null, it is called instead of `invoke`. It may keep the request until
-  // ExportedObject::endOfRequests(), or until another method of the object is called: a series of
-  // requests can then be carried out by one job. `arguments` are valid until it returns.
+  // If `post` is not null, the connection calls it instead of `invoke`. The object may keep the
+  // request until endOfRequests() or another of its methods is called. One job can then carry out a
+  // series of requests. `arguments` are valid until `post` returns.
   void (*post)(ExportedObject& object, std::span<const Value> arguments, PostedRequest&& request,
                ProcessID sender) = nullptr;
 };
 
-// A protocol that objects export. Made of constants; lives as long as the process. The name of the
-// type is part of the interface.
+// A protocol that objects export. All members are constants that live as long as the process. The
+// name of the type is part of the interface.
 struct NSXPCInterface {
   std::string_view name;
   std::string_view objectPath;
@@ -186,13 +188,14 @@ class NSXPCConnection {
   // Names the connection in log lines.
   [[nodiscard]] virtual std::string description() const = 0;
 
-  // The following four are called before resume(), each at most once.
+  // Call the following four functions before resume(), each at most once.
   virtual void setExportedInterface(const NSXPCInterface& interface) = 0;
   // The connection holds the object until it is invalidated.
   virtual void setExportedObject(std::shared_ptr<ExportedObject> object) = 0;
-  // Called when the other end has disconnected but the connection may be restored.
+  // The handler is called when the other end has disconnected but the connection may be restored.
   virtual void setInterruptionHandler(std::function<void()> handler) = 0;
-  // Called once, after all other calls: the connection has ended and is not restored.
+  // The handler is called once, after all other calls, when the connection has ended and will not
+  // be restored.
   virtual void setInvalidationHandler(std::function<void()> handler) = 0;
   // Starts delivery. Requests arrive in later turns of the thread's loop, never inside this call.
   virtual void resume() = 0;
@@ -215,8 +218,8 @@ class NSXPCListener {
   virtual ~NSXPCListener() = default;
   // Does not own the delegate, which must outlive the listener.
   virtual void setDelegate(NSXPCListenerDelegate& delegate) = 0;
-  // Accepts and serves connections on the calling thread. It returns only after the process was
-  // asked to end; failures of accepting are logged and retried.
+  // Accepts and serves connections on the calling thread. Returns only after the process was asked
+  // to end. If accepting a connection fails, logs the error and tries again.
   virtual void resume() = 0;
 };
 

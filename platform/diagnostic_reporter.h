@@ -36,8 +36,9 @@ class AILDiagnosticReporter {
 // Where diagnostic reporters come from. Any thread may call. The composition root owns the service.
 class DiagnosticReporterService {
  public:
-  // Asks for the state of the service as a dictionary. The source passes it to the callback,
-  // perhaps later and on another thread: the service reads its state on its reporting queue.
+  // A source passes the state of the service, as a dictionary, to the callback that it receives. It
+  // may do so later and on another thread, because the service reads its state on its reporting
+  // queue.
   using StateSource = std::function<void(std::function<void(const Dictionary& state)>)>;
 
   virtual ~DiagnosticReporterService() = default;

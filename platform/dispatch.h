@@ -26,14 +26,15 @@ enum class QueueThreading : std::uint8_t { kOwnThread, kShared };
 enum class JobWeight : std::uint8_t { kBrief, kMayBlock };
 
 // Counts signals until they are consumed. Any thread may signal, and a signal without a waiter is
-// kept. Shared by the code that signals and the code that waits. A queue that waits on it also
-// holds it.
+// kept. Shared by the code that signals and the code that waits. A queue that waits on a semaphore
+// also holds it.
 class DispatchSemaphore {
  public:
   virtual ~DispatchSemaphore() = default;
   virtual void signal() = 0;
   // Blocks the calling thread until there is a signal, and consumes it. There is no time limit.
-  // Only for a thread that may block. A job of a queue uses waitOn(), which costs no thread.
+  // Call it only on a thread that may block. A job of a shared queue calls waitOn() instead, which
+  // does not block its thread.
   virtual void wait() = 0;
 };
 
@@ -50,29 +51,29 @@ class DispatchQueue {
   // Adds a job and returns at once. The job never runs inside this call. The caller may therefore
   // hold a lock that the job takes.
   virtual void async(JobWeight weight, Job job) = 0;
-  // Waits on a semaphore of the same service without holding a thread. Only for jobs of shared
-  // queues: a job of this queue calls it at most once, as the last thing that it does. The queue
-  // runs no other job until it has consumed a signal or the time-out has passed; without a time-out
-  // it waits without limit. Then it runs `then` ahead of its waiting jobs. `then` is a job like any
-  // other and may call waitOn() again.
+  // Makes the queue wait on a semaphore of the same service, without blocking a thread. Only a job
+  // of this queue may call it, at most once, as its last action, and only if the queue is a shared
+  // one. The queue runs no other job until it has consumed a signal or the time-out has passed.
+  // Without a time-out, it waits without limit. It then runs `then` before its pending jobs. `then`
+  // is a job like any other and may call waitOn() again.
   virtual void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
                       std::optional<std::chrono::nanoseconds> timeout,
                       std::function<void(WaitOutcome)> then) = 0;
-  // Returns true if the queue runs no job, has none to run and does not wait. The calling thread
-  // then does its work as a job of this queue, and calls leave(). The work must be brief and must
-  // not call waitOn(). After false, the caller adds a job. A queue may always decline. Use
-  // QueueEntry.
+  // Lets the calling thread do brief work as if it were a job of this queue. Returns true if the
+  // queue runs no job, has none pending and does not wait on a semaphore. The caller then does the
+  // work, which must not call waitOn(), and calls leave(). If the result is false, the caller adds
+  // a job instead. A queue may always return false. Use QueueEntry rather than these two functions.
   [[nodiscard]] virtual bool tryEnter() { return false; }
   virtual void leave() {}
   // True on the thread that is running a job of this queue at the moment. For assertions.
   [[nodiscard]] virtual bool isCurrent() const = 0;
 };
 
-// Brief work that the calling thread does in a queue without adding a job, while this object
-// exists. Frequent work then needs neither an allocation nor a change of threads.
+// Lets the calling thread do brief work as a job of a queue while this object exists. Frequent work
+// then needs neither an allocation nor a change of threads.
 class QueueEntry {
  public:
-  // `queue` must outlive this.
+  // `queue` must outlive this object.
   explicit QueueEntry(DispatchQueue& queue) : queue_(queue), isInside_(queue.tryEnter()) {}
   QueueEntry(const QueueEntry&) = delete;
   QueueEntry& operator=(const QueueEntry&) = delete;
@@ -99,7 +100,7 @@ class DispatchService {
   virtual std::shared_ptr<DispatchQueue> createSerialQueue(std::string_view label,
                                                            QualityOfService quality,
                                                            QueueThreading threading) = 0;
-  // A new semaphore with that many signals in it.
+  // A new semaphore that already has `signals` signals.
   virtual std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals) = 0;
   // Runs the job once after the delay, on the background pool, in no particular order with other
   // jobs. A waiting job costs memory but no thread.

@@ -40,8 +40,8 @@ class FileService {
   // is not an error.
   [[nodiscard]] virtual std::optional<Error> createDirectory(std::string_view path,
                                                              std::uint32_t permissions) = 0;
-  // Begins a file in the directory. Never null: commit() reports the error, which the caller
-  // handles there anyway.
+  // Begins a file in the directory. Never returns null. If the file cannot be created, commit()
+  // returns the error, because the caller must handle errors of commit() anyway.
   [[nodiscard]] virtual std::unique_ptr<JsonArrayFile> createJsonArrayFile(
       std::string_view directory, std::string_view name) = 0;
 };

@@ -11,8 +11,8 @@
 
 namespace halvox::platform {
 
-// What a channel counts. The numbers are part of the interface. A source may send other numbers.
-// Readers must expect them.
+// What a channel counts. The numbers are part of the interface. A source may send other numbers,
+// and readers must expect them.
 enum class IOReportFormat : std::uint8_t {
   kInvalid = 0,
   kSimple = 1,
@@ -21,9 +21,9 @@ enum class IOReportFormat : std::uint8_t {
   kSimpleArray = 4,
 };
 
-// How the value of a simple channel changes. A counter only grows until it is reset, which begins
-// it at zero again. A gauge goes up and down. A value that falls is therefore a reset of a counter
-// and an ordinary change of a gauge.
+// How the value of a simple channel changes. A counter only grows, until a reset sets it to zero. A
+// gauge goes up and down. A value that falls is therefore a reset of a counter and an ordinary
+// change of a gauge.
 enum class IOReportKind : std::uint8_t { kGauge, kCounter };
 
 // Why an operation returned nothing.
@@ -66,8 +66,8 @@ struct IOReportChannel {
   std::int64_t maxValue = 0;                  // histogram
 };
 
-// Accessors under the names of the driver reporting interface. An index must be less than the
-// count: callers walk from 0 to it.
+// Accessors with the names of the driver reporting interface. They do not check an index, which
+// must be less than the count.
 inline IOReportFormat IOReportChannelGetFormat(const IOReportChannel& channel) {
   return channel.format;
 }
@@ -140,7 +140,7 @@ class IOReportChannels {
   virtual ~IOReportChannels() = default;
 };
 
-// Channels that are sampled together. Shared by everything that samples it.
+// Channels that are sampled together. Shared by all code that samples them.
 class IOReportSubscription {
  public:
   virtual ~IOReportSubscription() = default;
@@ -181,7 +181,7 @@ class IOReportService {
   using Subscription = std::shared_ptr<IOReportSubscription>;
   using Samples = std::shared_ptr<const IOReportSamples>;
   using Moment = std::unique_ptr<IOReportMoment>;
-  using Name = std::optional<std::string_view>;  // none: any
+  using Name = std::optional<std::string_view>;  // none: any name
   // Returns 0 to continue with the next channel.
   using Visitor = std::function<int(const IOReportChannel&)>;
 
@@ -197,20 +197,20 @@ class IOReportService {
   virtual Subscription IOReportCreateSubscription(const Channels& channels,
                                                   Channels& subscribedChannels,
                                                   std::optional<IOReportError>& error) = 0;
-  // Never null. Reads no counter; the first sample of the moment does.
+  // Makes a moment; never null. Does not read the counters: the first call of
+  // IOReportCreateSamples() for the moment reads them.
   [[nodiscard]] virtual Moment makeMoment() = 0;
   // The current values of the channels in the set. A channel that appears after the set was made is
   // not sampled. A channel of the set that disappears is skipped until a channel with its names and
-  // format exists again.
-  // The first call for a moment reads the counters; it uses no reading that began before the call.
-  // Further calls for the same moment use that reading. May block until the slowest source has
-  // answered or its time limit has passed.
+  // format exists again. The first call for a moment reads the counters. It never uses a reading
+  // that began before the call. Further calls for the same moment use the reading of the first. May
+  // block until the slowest source has answered or its time limit has passed.
   virtual Samples IOReportCreateSamples(const Subscription& subscription, const Channels& channels,
                                         IOReportMoment& moment,
                                         std::optional<IOReportError>& error) = 0;
-  // What changed from the previous samples to the current ones. Only channels that are in both are
-  // in the result: what a new channel counted before its first sample is unknown. Null without
-  // previous samples.
+  // What changed from the previous samples to the current ones. The result has only the channels
+  // that are in both, because what a new channel counted before its first sample is unknown.
+  // Returns null without previous samples.
   //
   // The difference
   //   of a gauge      is the current value minus the previous one, limited to what 64 bits hold;

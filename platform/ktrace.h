@@ -41,9 +41,9 @@ class KtraceSession {
 // but not inside an event handler.
 //
 // Failure: a start that fails still counts as a start. A call that is not allowed in the session's
-// state does nothing. The same holds for a call without a session or after its destruction. Calls
-// with a result return an error then. All of these must be harmless, because requests of clients
-// can cause them.
+// state does nothing. A call for a null or destroyed session does nothing either. If such a call
+// has a result, it returns an error. These calls must be harmless, because requests of clients can
+// cause them.
 //
 // The composition root owns the service.
 class KtraceService {

@@ -31,7 +31,7 @@ class LogCategory {
 
   // True if lines of that level are wanted.
   [[nodiscard]] bool isEnabled(LogLevel level) const {
-    // Relaxed, because a change of the level may be seen a little later.
+    // Relaxed, because it is harmless if a thread sees a change of the level a little later.
     return level >= threshold_.load(std::memory_order_relaxed);
   }
 
@@ -66,7 +66,7 @@ void appendLogPart(std::string& line, Number number) {
 inline void appendLogPart(std::string& line, bool flag) { line += flag ? '1' : '0'; }
 inline void appendLogPart(std::string& line, const Dictionary& value) { line += describe(value); }
 inline void appendLogPart(std::string& line, const Message& value) { line += describe(value); }
-// Anything with a description(). It is called only when the line is written.
+// Appends any object that has a description(). That function runs only if the line is written.
 template <typename Described>
 requires requires(const Described& part) {
   { part.description() } -> std::convertible_to<std::string>;
@@ -93,7 +93,7 @@ class UnitLog {
   constexpr UnitLog(CategoryAccessor category, std::string_view unit)
       : category_(category), unit_(unit) {}
 
-  // The first part of a line. It also carries the line number of the call.
+  // The first part of a line. It also carries the number of the source line that logs.
   struct Text {
     // std::source_location does the same, but the standard library of clang 14 does not have it.
     // The constructor is implicit, so that call sites read as plain text.

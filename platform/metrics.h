@@ -14,9 +14,9 @@ class MetricService {
  public:
   virtual ~MetricService() = default;
 
-  // Records the message's encoded bytes under that identifier. Encodes before it returns and does
-  // not keep the message. Never waits for the disk; when more records are pending than the service
-  // may hold, it waits until there is room.
+  // Records the message's encoded bytes under that identifier. Encodes the message before it
+  // returns and does not keep it. Does not wait until the record is on the disk, but blocks while
+  // the service holds its maximum of pending records.
   virtual void postIssueMetric(std::uint32_t metricID, const ProtoBase& message) = 0;
 };
 

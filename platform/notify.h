@@ -23,10 +23,10 @@ class NotifyService {
 
   virtual ~NotifyService() = default;
 
-  // Registers a handler for the life of the process. It runs on the queue after a post of that
-  // name, with the token of this registration. Posts in quick succession may become one call. Sets
-  // `token` and returns 0; on failure, such as a name that cannot exist, returns an error and
-  // leaves `token` unchanged.
+  // Registers a handler for the life of the process. After a post of that name, the handler runs on
+  // the queue with the token of this registration. It may run only once for several posts in quick
+  // succession. Sets `token` and returns 0. If registration fails, for example because the name is
+  // not valid, returns an error and leaves `token` unchanged.
   virtual NotifyStatus notify_register_dispatch(std::string_view name, NotifyToken& token,
                                                 std::shared_ptr<DispatchQueue> queue,
                                                 Handler handler) = 0;

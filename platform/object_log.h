@@ -7,13 +7,14 @@
 namespace halvox::platform {
 
 // Writes the log lines of one object. It has the category that the object received when it was
-// made, and the name of the object's unit. An object that receives the log service has one of these
-// as a member. A UnitLog would be wrong there, because it looks its category up once for the life
-// of the process.
+// made, and the name of the object's unit. An object that receives the log service as an argument
+// has an ObjectLog as a member. A UnitLog would be wrong there, because a unit looks its category
+// up once for the life of the process.
 //
 //   log_.info("watching ", directory);
 //
-// Copies are cheap. Any thread may use it. The log service owns the category and must outlive this.
+// Copies are cheap. Any thread may use it. The log service owns the category and must outlive every
+// copy.
 class ObjectLog {
  public:
   // `unit` is not copied: pass a constant.

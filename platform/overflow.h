@@ -15,8 +15,9 @@ struct OverflowPlace {
   std::size_t length = 0;  // in bytes
 };
 
-// Keeps bytes outside memory for the life of the process. For bytes that clients make the service
-// keep and that are read late or never. Nothing remains after the process, however it ends.
+// Keeps bytes outside memory for the life of the process. It is meant for bytes that clients make
+// the service keep and that are read late or never. When the process ends, in whatever way, nothing
+// remains.
 //
 // Any thread may call. Writing and reading may wait for the disk, usually for less time than the
 // bytes take to copy, because they go through the page cache. The composition root owns the
@@ -32,10 +33,10 @@ class OverflowService {
   // unchanged.
   [[nodiscard]] virtual std::optional<Error> write(std::span<const std::byte> bytes,
                                                    OverflowPlace& place) = 0;
-  // Reads the bytes at a place that write() returned. `bytes` has the length of the place.
+  // Reads the bytes at a place that write() returned. `bytes` must have the length of the place.
   [[nodiscard]] virtual std::optional<Error> read(OverflowPlace place,
                                                   std::span<std::byte> bytes) = 0;
-  // Gives the room at a place back. The place must not be used again.
+  // Frees a place, which must not be used again.
   virtual void release(OverflowPlace place) = 0;
 };
 

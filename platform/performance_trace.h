@@ -17,16 +17,16 @@ class KQTraceConfig {
 
 // Receives the progress of a performance trace.
 //
-// The service calls on one of its threads, never inside a call to the session. A trace that was
-// started ends in exactly one completion, with an error if recording or saving failed. A trace
-// whose start failed never completes.
+// The service calls these functions on one of its threads, never inside a call to the session. A
+// trace that was started ends in exactly one completion, with an error if recording or saving
+// failed. A trace whose start failed never completes.
 class KQTraceSessionDelegate {
  public:
   virtual ~KQTraceSessionDelegate() = default;
 
   virtual void kqTraceDidStart(const std::optional<Error>& error) = 0;
   virtual void kqTraceDidStop(const std::optional<Error>& error) = 0;
-  // The finished trace is at `url`. The token has no meaning here.
+  // The finished trace is at `url`. `token` has no meaning.
   virtual void kqTraceDidComplete(const std::string& url, std::uint64_t token,
                                   const std::optional<Error>& error) = 0;
 };
@@ -36,20 +36,22 @@ class KQTraceSessionDelegate {
 //   made --start--> recording --stop--> saved, its completion is reported
 //        --start fails--> made
 //
-// Shared by the code that started it and, while it works, by the service. If only the service holds
-// it while it records, the recording ends, its data is deleted, and the delegate is not called.
+// Shared by the code that started it and, while it works, by the service. If all others release a
+// session that records, the service ends the recording, deletes its data and does not call the
+// delegate.
 //
-// Any thread may call. A start during a recording does nothing, nor does a stop outside of one.
-// Every failure is reported to the delegate.
+// Any thread may call. A start during a recording and a stop without a recording do nothing. Every
+// failure is reported to the delegate.
 class KQTraceSession {
  public:
   virtual ~KQTraceSession() = default;
 
-  // Keeps a weak reference to the delegate. An empty pointer ends the calls: the calls of a trace
-  // that was replaced must not be mistaken for those of its successor.
+  // Keeps a weak reference to the delegate. An empty pointer ends the calls to it. A caller that
+  // replaces a trace passes one, because the delegate could not tell the calls of the old trace
+  // from those of the new one.
   virtual void setDelegate(std::weak_ptr<KQTraceSessionDelegate> delegate) = 0;
-  // Both return at once, whatever the tracer does, and are carried out in the order of the calls.
-  // The delegate learns how they ended.
+  // Both return at once, whatever the tracer does. The service carries them out in the order of the
+  // calls and reports the results to the delegate.
   virtual void startKQTrace() = 0;
   virtual void stopKQTrace() = 0;
 };

@@ -17,8 +17,8 @@ class PowerLogService {
   virtual ~PowerLogService() = default;
 
   // Records one event: its payload, and the entries of `extra` whose keys the payload does not
-  // have. Never waits for the disk; when more records are pending than the service may hold, it
-  // waits until there is room.
+  // have. Does not wait until the record is on the disk, but blocks while the service holds its
+  // maximum of pending records.
   virtual void logPowerEvent(std::uint32_t categoryID, std::string_view eventName,
                              const Dictionary& payload, const std::optional<Dictionary>& extra) = 0;
 };

@@ -9,9 +9,9 @@ namespace halvox::platform {
 
 // The settings store: values by key, in domains of users.
 //
-// Every call reads the store again: no change can be missed, and no cache has to be invalidated. A
-// domain that does not exist, a file that cannot be read and a missing key all have the same
-// result: no value.
+// Every call reads the store again. No change can therefore be missed, and there is no cache to
+// invalidate. A domain that does not exist, a file that cannot be read and a missing key all have
+// the same result: no value.
 //
 // Any thread may call; a call reads a file. The composition root owns the service.
 class PreferenceService {

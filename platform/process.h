@@ -28,8 +28,8 @@ class ProcessService {
   [[nodiscard]] virtual std::optional<ProcessRecord> processRecord(ProcessID pid) const = 0;
   [[nodiscard]] virtual ProcessID ownProcessIdentifier() const = 0;
   [[nodiscard]] virtual std::string ownProcessName() const = 0;
-  // Ends the process at once, without running destructors or flushing anything. Two rules of the
-  // service demand such an end.
+  // Ends the process at once, without running destructors or flushing anything. Two features of the
+  // service require such an end.
   [[noreturn]] virtual void terminate(int exitStatus) = 0;
 };
 

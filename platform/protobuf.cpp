@@ -10,8 +10,8 @@ constexpr unsigned kWireTypeBits = 3;
 constexpr unsigned kMaximumVarintBytes = 10;  // 64 bits, seven to a byte
 constexpr unsigned kVarintBitsPerByte = 7;
 constexpr std::uint8_t kVarintContinues = 0x80;
-// Each level of a group is a level of recursion. Hostile bytes can contain one more level with each
-// byte. Real messages contain no groups.
+// The reader recurses for each nested group, and hostile bytes can open one more group with each
+// byte. Without a bound they would overflow the stack. Real messages contain no groups.
 constexpr unsigned kMaximumGroupDepth = 100;
 
 void appendEscaped(std::string& text, char character) {

@@ -58,7 +58,7 @@ class ProtoReader {
   [[nodiscard]] std::size_t position() const { return position_; }
   [[nodiscard]] std::size_t end() const { return bytes_.size(); }
   [[nodiscard]] bool hasError() const { return error_; }
-  // True while the end is not reached and nothing has failed.
+  // True until the end is reached or a read has failed.
   [[nodiscard]] bool hasMore() const { return position_ < end() && !error_; }
 
   // The varint at the position. A varint that the end cuts off sets the error flag and reads as 0.
@@ -69,10 +69,10 @@ class ProtoReader {
   // Copies the string at the position to `value`. If the string is longer than the remaining bytes,
   // sets the error flag and leaves `value` unchanged.
   void readString(std::string& value);
-  // Skips the value of a field whose tag was read; a group is skipped to its end. Returns false,
-  // and sets the error flag, if the value is cut off, its wire type has no value, a group is not
-  // closed by its own number, or groups are nested more than 100 deep. The depth is bounded because
-  // skipping recurses.
+  // Skips the value of a field whose tag was read, and a group to its end. Returns false and sets
+  // the error flag if the bytes end before the value, if no value has this wire type, if a group
+  // ends with the number of another group, or if groups are nested more than 100 deep. The depth is
+  // bounded because skipping recurses.
   [[nodiscard]] bool skipField(std::uint64_t number, ProtoWireType wireType);
 
  private:

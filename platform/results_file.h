@@ -31,9 +31,9 @@ class ResultsFileService {
                                std::uint32_t version, std::uint32_t flags) = 0;
   virtual void sswriter_new_value(Sswriter& writer, std::string_view name, ssunit unit,
                                   double value) = 0;
-  // Finishes the file, which then appears under its name and replaces an older one. Until then it
-  // is not visible. A writer that is destroyed instead leaves no file. Does nothing without a
-  // writer.
+  // Finishes the file, which then appears under its name and replaces an older one. Before this
+  // call the file is not visible. A writer that is destroyed without it leaves no file. Does
+  // nothing if `writer` is null.
   virtual void sswriter_close(Writer writer) = 0;
 };
 

@@ -7,8 +7,8 @@
 namespace halvox::platform {
 namespace {
 
-// A static variable of a function and not a global, because static initialisers of other files may
-// call this.
+// A static variable of a function, not a global one, because static initialisers of other files may
+// call this function before the globals of this file exist.
 std::optional<Services>& slot() {
   static std::optional<Services> services;
   return services;

@@ -61,8 +61,8 @@ struct Services {
 // because the functions below are called for every message.
 void installServices(const Services& services);
 
-// The installed services. Any thread may call them after installServices(). A call before it is a
-// mistake of the program: it prints a line and aborts.
+// The installed services. Any thread may call them after installServices(). An earlier call is a
+// bug in the program: it prints a line and aborts the process.
 AnalyticsService& analytics();
 ClockService& clock();
 ConnectionService& connections();

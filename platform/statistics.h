@@ -16,9 +16,9 @@ class Counter {
   std::atomic<std::uint64_t> value_{0};  // relaxed: no other memory is published through it
 };
 
-// The service's own bookkeeping: what was received, delivered, suppressed and dropped, by reason.
-// For each piece, received = delivered + suppressed + dropped. A loss that was not counted shows as
-// a difference.
+// Counts what the pieces of the service, such as "session", received, delivered, suppressed and
+// dropped, by reason. For each piece, received = delivered + suppressed + dropped. If the sums
+// differ, something was lost and not counted.
 //
 // Any thread may call. The composition root owns the service.
 class StatisticsService {
@@ -26,8 +26,9 @@ class StatisticsService {
   virtual ~StatisticsService() = default;
 
   // The counter of that piece and name, such as ("session", "suppressed: redundant"). The first
-  // call makes it, and it lives as long as the service. Callers look it up once and keep the
-  // reference, never in a static variable: a look-up takes a lock and compares names.
+  // call makes it, and it lives as long as the service. Callers look a counter up once and keep the
+  // reference, because a look-up takes a lock and compares names. They do not keep it in a static
+  // variable, which would outlive the service.
   virtual Counter& counter(std::string_view piece, std::string_view name) = 0;
 };
 

@@ -45,8 +45,8 @@ class TLMSecureHierarchyToken {
   const std::string text_;
 };
 
-// A session of the framework: what its back-ends need to know about it. The framework makes it; the
-// code that asked for it holds it, and ends it by releasing it.
+// A session of the framework: what its back-ends need to know about it. The framework makes it. The
+// code that asked for it holds it, and ends the session by releasing it.
 class TLMReportingSession {
  public:
   virtual ~TLMReportingSession() = default;
@@ -87,16 +87,17 @@ class TLMReportingService {
                                             const Dictionary& userInfo) = 0;
   // Begins to look for back-ends and returns. The callback is called exactly once, on a thread of
   // the framework: never inside this call, and never on the queue of the caller's job, which may be
-  // waiting for it. It may run before this call returns, and after all other holders have released
-  // the session. It must own what it uses.
+  // waiting for it. The callback may run before this call returns. It may also run after all other
+  // holders have released the session, and must therefore own what it uses.
   virtual void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) = 0;
   virtual TLMReportingOutcome TLMReportingSendMessage(const Session& session,
                                                       const TLMReportingMessage& message) = 0;
-  // True if a send at this moment would only queue the message, without waiting for room. A thread
-  // that has requests to answer can then send by itself.
+  // True if TLMReportingSendMessage() would now only put the message into a queue, and would not
+  // wait until the queue has space. A thread that must not block, such as the I/O thread, can then
+  // call it.
   [[nodiscard]] virtual bool onlyNotesMessages() const { return false; }
-  // Sends what the framework still holds for the session. `flushed` is called exactly once, when
-  // that is done or given up; this may be before the call returns.
+  // Sends the messages that the framework still holds for the session. Calls `flushed` exactly
+  // once, when they are sent or the framework gives up. That may be before this call returns.
   virtual void TLMReportingFlushMessages(const Session& session, std::function<void()> flushed) = 0;
   // Sends one message outside any session.
   virtual TLMReportingOutcome TLMReportingSendOneMessage(const Dictionary& sessionInfo,

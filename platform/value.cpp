@@ -27,8 +27,8 @@ ConstantTable& constantTable() {
   return table;
 }
 
-// 2^63 and 2^64 are exact as doubles, while the largest integers below them are not: comparing with
-// those would round up and let a conversion overflow.
+// 2^63 and 2^64 are exact as doubles. The largest integers of 64 bits are not: they would be
+// rounded up to these powers, and a comparison with them would let a conversion overflow.
 constexpr double kTwoTo63 = 9223372036854775808.0;
 constexpr double kTwoTo64 = 18446744073709551616.0;
 
@@ -49,7 +49,7 @@ bool equalsDouble(std::int64_t bits, bool isSigned, double number) {
          static_cast<std::uint64_t>(number) == static_cast<std::uint64_t>(bits);
 }
 
-// A NaN equals every NaN: values that print the same count as the same (see Value).
+// A NaN equals every NaN (see Value).
 bool equalDoubles(double left, double right) {
   return left == right || (std::isnan(left) && std::isnan(right));
 }
@@ -266,7 +266,7 @@ Dictionary Value::dictionary() const {
   return {payload<DictionaryRep*>(), count};
 }
 
-// Only for a counted reference.
+// Call only if isCounted() is true.
 std::size_t Value::heapSize() const {
   switch (tag()) {
     case Tag::kSharedString:

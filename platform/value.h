@@ -25,8 +25,8 @@ struct Date {
 };
 
 // A program constant whose identity is kept: a value made from a text that equals a constant is
-// that very constant, even if the text came from another process. This is how clients select things
-// that the service tests by identity.
+// that very constant, even if the text came from another process. The service tests some values by
+// identity; a client selects one by sending its text.
 //
 // Make constants only with static storage and before the first thread starts: the table of
 // constants has no lock. Each has at most 64 bytes and a text of its own.
@@ -55,7 +55,7 @@ void retain(KeyNode& node) noexcept;
 void retain(DataRep& node) noexcept;
 void retain(ArrayRep& node) noexcept;
 void retain(DictionaryRep& node) noexcept;
-// Each gives up one reference and destroys the node if it was the last.
+// Each removes one reference and destroys the node if it was the last.
 void release(KeyNode& node) noexcept;
 void release(DataRep& node) noexcept;
 void release(ArrayRep& node) noexcept;
@@ -88,7 +88,7 @@ class Reference {
     return reference.node_ == nullptr;
   }
 
-  // Returns the node, still counted, and is null from then on.
+  // Returns the node without changing its count, and sets this reference to null.
   [[nodiscard]] Node* take() { return std::exchange(node_, nullptr); }
 
  private:
@@ -97,12 +97,12 @@ class Reference {
 
 }  // namespace detail
 
-// The key of a dictionary entry: an immutable text. Equal keys share one node, which makes
-// comparing them a comparison of pointers.
+// The key of a dictionary entry: an immutable text. Keys are interned: equal keys share one node of
+// a table, and comparing them means comparing pointers.
 //
-// The table of shared nodes is bounded, because clients choose the keys. A key for which the table
-// has no room works the same way but owns its text. Any thread may make and copy keys; one key
-// object belongs to one thread at a time.
+// The table is bounded, because clients choose the keys. A key that the table cannot take is not
+// interned: it works in the same way, but has a node of its own and is compared by its text. Any
+// thread may make and copy keys; one key object belongs to one thread at a time.
 class Key {
  public:
   Key(std::string_view text);
@@ -111,8 +111,8 @@ class Key {
 
   // Valid while a copy of this key exists.
   [[nodiscard]] std::string_view text() const;
-  // Not secret: clients can make keys with equal hashes. See secretHash() for tables of client
-  // keys.
+  // Clients can make keys with equal hashes, because this hash has no secret. Tables of keys from
+  // clients use secretHash().
   [[nodiscard]] std::uint32_t hash() const;
   // True if the text has a space (U+0020). Stored in the node, because it is read for every key of
   // every message.
@@ -122,7 +122,7 @@ class Key {
   // Bytes that this key alone keeps in memory; 0 for an interned key.
   [[nodiscard]] std::size_t memorySize() const;
 
-  // True if both share one node. For a key that is interned, this is the same as being equal.
+  // True if both share one node. If one of the keys is interned, this means that they are equal.
   [[nodiscard]] bool sharesNode(const Key& other) const { return node_ == other.node_; }
   friend bool operator==(const Key& left, const Key& right) {
     return left.node_ == right.node_ || equalNodes(*left.node_, *right.node_);
@@ -174,7 +174,7 @@ enum class ValueKind : std::uint8_t { kNone, kNumber, kString, kDate, kData, kAr
 //
 // Values are immutable and shared: a copy costs at most one increment of a reference count, and
 // numbers and short strings live in the value itself. Up to six consumers and a history hold the
-// same message. Sharing must therefore be cheap. It needs no lock. Different threads may use
+// same message, which is why sharing must be cheap. It needs no lock. Different threads may use
 // different copies at once; one value object belongs to one thread at a time.
 //
 // Two values are equal if their contents are equal. Numbers compare by value, whatever type they
@@ -205,8 +205,8 @@ class Value {
     std::memcpy(storage_, other.storage_, sizeof storage_);
     other.setTag(Tag::kNone);
   }
-  // The new content is taken before the old one is released: `other` may be this value or be inside
-  // it. NOLINTNEXTLINE(bugprone-unhandled-self-assignment): the copy handles it
+  // Copies the new content before it releases the old one, because `other` may be this value or a
+  // part of it. NOLINTNEXTLINE(bugprone-unhandled-self-assignment): the copy handles it
   Value& operator=(const Value& other) noexcept {
     Value taken(other);
     std::swap(storage_, taken.storage_);
@@ -249,7 +249,7 @@ class Value {
   // True if this string is that very constant (see StringConstant).
   [[nodiscard]] bool isIdenticalTo(const StringConstant& constant) const;
 
-  // The content; an empty one if the value is of another kind.
+  // The content; empty if the value is of another kind.
   [[nodiscard]] Date date() const;
   [[nodiscard]] Data data() const;
   [[nodiscard]] Array array() const;
@@ -303,7 +303,8 @@ class Value {
 
   // Byte 0 is the tag. A number, date or reference is in bytes 8 to 15. A dictionary's number of
   // entries is in bytes 4 to 7. An inline string has its length in byte 1 and its text from byte 2
-  // on. Sixteen bytes, because a dictionary entry has one and messages have dozens of entries.
+  // on. A value has only 16 bytes, because each entry of a dictionary has one and messages have
+  // dozens of entries.
   alignas(8) unsigned char storage_[16] = {};
 };
 
@@ -331,18 +332,19 @@ class Array {
 
 // A dictionary from texts to values.
 //
-// Copies share their content until one of them is changed. The change copies the content first: no
-// holder sees the change of another. Different threads may use different copies at once; one object
-// belongs to one thread at a time.
+// Copies share their content until one of them is changed. A change copies the content first.
+// Therefore no holder sees the change of another. Different threads may use different copies at
+// once; one object belongs to one thread at a time.
 //
-// One change needs no copy: adding an entry after all others, if reserve() has made room for it.
-// Each holder knows how many of the shared entries are its own. A message is stamped, tagged and
-// kept in one block of memory, although some consumers hold it without its tag.
+// One change needs no copy: adding an entry after all others, if reserve() has allocated memory for
+// it. Each holder knows how many of the shared entries are its own. The service can therefore add
+// time stamps and a tag to a message within one block of memory, although some consumers hold the
+// message without the tag.
 //
 // Entries are enumerated in the order in which their keys were first set. A small dictionary is
-// searched key by key, a large one by an index with a secret hash. The time that a client's keys
-// cost is therefore proportional to their bytes, even if there are many or they are made to
-// collide.
+// searched key by key, a large one by an index with a secret hash. The time that the keys of a
+// client cost is therefore proportional to their total length, even if the client sends many keys
+// or chooses keys that collide.
 class Dictionary {
  public:
   struct Entry {
@@ -368,11 +370,12 @@ class Dictionary {
   }
   [[nodiscard]] bool contains(std::string_view key) const { return find(key) != nullptr; }
 
-  // Makes room for that many entries in total, so that setting them allocates nothing more.
+  // Allocates memory for that many entries in total. Setting them then allocates no further memory
+  // for entries.
   void reserve(std::size_t entries);
   // Sets the value under a key. An existing key keeps its position; a new one goes to the end.
   void set(const Key& key, Value value);
-  // Does the same for a key that the caller knows to be absent, without looking for it.
+  // Like set(), but does not search for the key. The caller must know that the key is absent.
   void add(const Key& key, Value value);
   // Sets the value of the entry at a position, which must be less than size().
   void setAt(std::size_t position, Value value);

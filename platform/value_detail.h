@@ -23,9 +23,9 @@ inline void retain(ReferenceCount& references) noexcept {
   references.fetch_add(1, std::memory_order_relaxed);
 }
 
-// Gives up one reference. True if it was the last one and the caller must destroy the node; all use
-// of the node by other threads happens before that. The load saves the costlier fetch_sub for a
-// node without other holders, which is the common case.
+// Removes one reference. Returns true if it was the last one: the caller must then destroy the
+// node. All use of the node by other threads happens before a return of true. For a node without
+// other holders, which is the common case, the load replaces the more expensive fetch_sub.
 inline bool releaseLast(ReferenceCount& references) noexcept {
   return references.load(std::memory_order_acquire) == 1 ||
          references.fetch_sub(1, std::memory_order_acq_rel) == 1;
@@ -73,12 +73,14 @@ struct ArrayRep {
 };
 
 // The entries of dictionaries, in the order of setting. Several dictionaries may share a node. Each
-// consists of the first `count_` entries. An entry that was added while the node was shared belongs
-// to the dictionary that added it. If there is an index, each of them has all entries.
+// of them has the first entries of the node, as many as its own `count_`. An entry that was added
+// while the node was shared belongs only to the dictionary that added it and to copies of that. If
+// the node has an index, every dictionary that shares it has all entries.
 struct DictionaryRep {
   ReferenceCount references;
-  // The number of entries that were made. Relaxed: it only decides which dictionary may make the
-  // next one. A thread that reads an entry has received the dictionary from the one that made it.
+  // The number of entries that exist. Relaxed, because it only decides which dictionary may add the
+  // next entry. It need not publish the entries: a thread that reads an entry has received the
+  // dictionary from the thread that added the entry.
   std::atomic<std::uint32_t> used;
   std::uint32_t capacity;
   std::uint32_t indexSize;  // a power of two; 0 while the dictionary is small
@@ -89,8 +91,8 @@ struct DictionaryRep {
   }
 };
 
-// A hash with a secret that each process chooses for itself. For tables whose keys come from
-// clients: without the secret, a client cannot choose keys that collide.
+// A hash with a secret that each process chooses for itself. It is for tables whose keys come from
+// clients: a client that does not know the secret cannot choose keys that collide.
 std::uint32_t secretHash(std::string_view text);
 
 }  // namespace halvox::platform::detail

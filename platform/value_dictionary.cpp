@@ -11,8 +11,8 @@ namespace {
 
 using Reference = detail::Reference<DictionaryRep>;
 
-// Up to this number of entries, comparing all keys is faster than an index: interned keys compare
-// as pointers.
+// Up to this number of entries, comparing all keys is faster than an index, because interned keys
+// are compared as pointers.
 constexpr std::uint32_t kMaxWithoutIndex = 16;
 constexpr std::uint32_t kFirstCapacity = 4;
 
@@ -89,8 +89,8 @@ Dictionary::Entry* findEntry(const Reference& rep, std::size_t count, const Key&
   const auto matches = [&key](const Dictionary::Entry& entry) { return entry.key == key; };
   if (rep->indexSize != 0) return findIndexedEntry(rep, key.text(), matches);
   if (!key.isInterned()) return findEntry(rep, count, matches);
-  // Compares nodes and reads no text: a message is searched for several keys, nearly all of which
-  // it does not have.
+  // Compare nodes without reading texts: each message is searched for several keys, and has almost
+  // none of them.
   return findEntry(rep, count,
                    [&key](const Dictionary::Entry& entry) { return entry.key.sharesNode(key); });
 }
@@ -128,8 +128,8 @@ const Value* Dictionary::find(std::string_view key) const {
 
 bool Dictionary::isAlone() const { return rep_->references.load(std::memory_order_acquire) == 1; }
 
-// Ensures that no other dictionary shares the content, and that there is room for `entries` entries
-// in total.
+// Ensures that no other dictionary shares the content, and that memory for `entries` entries in
+// total is allocated.
 void Dictionary::makeRoomFor(std::size_t entries) {
   if (rep_ == nullptr) {
     rep_ = allocateRep(std::max<std::size_t>(entries, kFirstCapacity));
@@ -138,12 +138,12 @@ void Dictionary::makeRoomFor(std::size_t entries) {
   }
   const bool alone = isAlone();
   if (alone) {
-    // The entries of other dictionaries, which have been destroyed.
+    // Destroy the entries that other dictionaries had added. These dictionaries no longer exist.
     const std::uint32_t used = rep_->used.exchange(count_, std::memory_order_relaxed);
     std::destroy_n(rep_->entries() + count_, used - count_);
     if (entries <= rep_->capacity) return;
   }
-  // The copy of a shared dictionary gets exactly the room that it needs, because it is usually
+  // The copy of a shared dictionary gets exactly the capacity that it needs, because it is usually
   // changed once and then kept. A dictionary that grows entry by entry grows by half of its size.
   const std::size_t capacity =
       alone ? std::max<std::size_t>(entries, rep_->capacity + rep_->capacity / 2) : entries;
@@ -180,8 +180,9 @@ void Dictionary::add(const Key& key, Value value) {
   noteAppended(*rep_, count_);
 }
 
-// Adds an entry after those of all holders. The other holders do not see it. Returns false if that
-// is not possible.
+// Adds an entry after all entries of the node, without copying the node even if others share it.
+// The other holders do not see the entry. Returns false and changes nothing if it cannot add the
+// entry in this way.
 bool Dictionary::tryAddShared(const Key& key, Value& value) {
   if (rep_ == nullptr || count_ >= rep_->capacity || count_ >= kMaxWithoutIndex) return false;
   std::uint32_t expected = count_;
@@ -189,9 +190,11 @@ bool Dictionary::tryAddShared(const Key& key, Value& value) {
     if (rep_->used.load(std::memory_order_relaxed) != expected) return false;
     rep_->used.store(expected + 1, std::memory_order_relaxed);
   } else {
-    // A container may hold this very dictionary, which would then hold itself and never be freed.
+    // The value may contain this dictionary. The node would then refer to itself and never be
+    // freed.
     if (value.isArray() || value.isDictionary()) return false;
-    // Claims the entry: another holder may be about to add one too.
+    // Claim the position first, because another holder may try to add its own entry there at the
+    // same time.
     if (!rep_->used.compare_exchange_strong(expected, count_ + 1, std::memory_order_relaxed)) {
       return false;
     }

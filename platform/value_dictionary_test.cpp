@@ -139,7 +139,7 @@ TEST(DictionaryTest, ADictionaryCanHoldAnOlderStateOfItself) {
 }
 
 TEST(DictionaryTest, AKeyOrValueOfItsOwnCanBeSet) {
-  Dictionary dictionary = numbered(4);  // no room for a fifth
+  Dictionary dictionary = numbered(4);  // no capacity for a fifth entry
   dictionary.set("copy", *dictionary.find("key 3"));
   dictionary.set(dictionary.begin()->key, (dictionary.begin() + 1)->value);
   EXPECT_EQ(*dictionary.find("copy"), Value(3));
@@ -202,7 +202,7 @@ TEST(DictionaryTest, AValueKeepsHowManyEntriesAreItsOwn) {
   EXPECT_EQ(Value(original).dictionary().size(), 2U);
 }
 
-// A leak would be found by AddressSanitizer.
+// AddressSanitizer reports a leak here.
 TEST(DictionaryTest, AnOlderStateOfItselfIsNotPutIntoTheSameMemory) {
   Dictionary dictionary;
   dictionary.reserve(4);

@@ -6,7 +6,7 @@
 namespace halvox::platform::detail {
 namespace {
 
-// The secret part of the hash: without it, a client cannot compute keys that collide.
+// The secret part of the hash. A client that does not know it cannot compute keys that collide.
 struct Secret {
   std::uint64_t first;
   std::uint64_t second;

@@ -10,8 +10,8 @@ namespace {
 
 using detail::KeyNode;
 
-// Interned keys are never freed, and clients choose them: their number must be bounded. Real
-// vocabularies have a few hundred keys. Long texts are not worth a slot.
+// The number of interned keys must be bounded, because they are never freed and clients choose
+// them. Real vocabularies have a few hundred keys. Long texts are not worth a slot.
 constexpr std::size_t kMaxInternedKeys = 4096;
 constexpr std::size_t kMaxInternedLength = 128;
 constexpr std::size_t kTableSlots = 4 * kMaxInternedKeys;  // at most a quarter full
@@ -28,11 +28,12 @@ KeyNode* makeNode(std::string_view text, std::uint32_t hash, bool interned) {
   return node;
 }
 
-// The table of interned keys. Any thread may call. A slot that was filled never changes again; this
-// is why readers need no lock.
+// The table of interned keys. Any thread may call. Readers need no lock, because a slot that was
+// filled never changes again.
 class InternTable {
  public:
-  // The shared node of that text, which is made if there is room; null if there is none.
+  // Returns the shared node of that text. Makes one if there is none yet. Returns null if the text
+  // cannot be interned because the table is full or too many of its slots are occupied.
   KeyNode* intern(std::string_view text, std::uint32_t hash) {
     const Probe found = probe(text, hash);
     if (found.node != nullptr || found.freeSlot == nullptr) return found.node;
@@ -109,9 +110,9 @@ std::size_t Key::memorySize() const {
   return node_->interned ? 0 : sizeof(KeyNode) + node_->length;
 }
 
-// Only for different nodes. Their texts differ if one of them is interned: a text is interned
-// either at all times or never, because the table only fills up. A full table has room for no later
-// text, and a text that has found its slots occupied finds them occupied for ever.
+// Call only for different nodes. If one of the nodes is interned, their texts differ, because all
+// keys with its text share it. A text that was not interned once is never interned later: a table
+// that was full stays full, and slots that were occupied stay occupied.
 bool Key::equalNodes(KeyNode& left, KeyNode& right) {
   if (left.interned || right.interned) return false;
   return left.hash == right.hash && left.view() == right.view();

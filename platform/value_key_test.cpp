@@ -76,8 +76,8 @@ TEST(KeyTest, SelfAssignmentKeepsTheText) {
   EXPECT_EQ(key.text(), std::string(200, 'x'));
 }
 
-// Runs in a child process, because the table that it fills belongs to the process. Exits with 0 if
-// all checks hold.
+// Runs in a child process, because it fills the table, which all tests of a process share. Exits
+// with 0 if all checks hold.
 [[noreturn]] void fillTheTable() {
   const Key early("early");
   std::size_t interned = 0;

@@ -254,7 +254,7 @@ TEST_F(TraceParamsParserTest, BrokenFileIsLoggedAndGivesAnEmptyRecord) {
   platform_.propertyLists.setBrokenFile(kFile);
 
   EXPECT_TRUE(TraceParamsParser(kFile).loadTraceParams().tracePoints.empty());
-  EXPECT_EQ(errors()[0], "Reading from plist file failed with error: no property list");
+  EXPECT_EQ(errors()[0], "Reading from plist file failed with error: not a property list");
   EXPECT_EQ(errors()[1], "No valid input found in plist.");
 }
 

@@ -12,16 +12,17 @@
 
 namespace halvox::platform {
 
-// Keeps the events that it was sent. At first it wants every name.
+// Keeps the events that were sent to it. At first it wants every name.
 //
-// The sender never builds a payload. Like the store, the fake builds it later: when the test reads
-// the events, or when the test requests it. Building it in the sender's call would hide a builder
-// with a dangling reference.
+// The fake never builds a payload in the sender's call, because that would hide a builder with a
+// dangling reference. Like the store, it builds the payload later: by default when the test reads
+// the events.
 //
-// Any thread may call; the test reads on its own. FakePlatform owns it.
+// Any thread may call the service; only the test's thread reads the results. FakePlatform owns it.
 class FakeAnalyticsService final : public AnalyticsService {
  public:
-  // kWhenSent: on another thread at once, like a store whose writer is faster than the sender.
+  // When payloads are built: when the test reads the events; when the test calls buildPayloads();
+  // or at once, on another thread, like a store whose writer is faster than the sender.
   enum class Building : unsigned char { kWhenRead, kWhenTold, kWhenSent };
   struct Event {
     std::string name;
@@ -62,7 +63,7 @@ class FakeAnalyticsService final : public AnalyticsService {
   mutable std::mutex mutex_;
   std::optional<std::set<std::string, std::less<>>> wanted_;  // none: everything
   Building building_ = Building::kWhenRead;
-  mutable std::vector<Record> records_;  // reading builds
+  mutable std::vector<Record> records_;  // mutable: reading them builds payloads
   std::vector<std::string> tested_;
 };
 

@@ -61,7 +61,7 @@ std::vector<FakeCall::Reply> FakeCall::replies() const {
 Value FakeCall::value() const {
   const std::vector<Reply> all = replies();
   if (all.size() != 1 || all.front().error.has_value()) {
-    throw std::logic_error(method_ + " was not answered once and without error");
+    throw std::logic_error("expected exactly one answer of " + method_ + ", without an error");
   }
   return all.front().value;
 }
@@ -75,7 +75,7 @@ void FakeCall::add(const std::optional<Error>& error, const Value& value) {
 std::shared_ptr<FakeCall> FakeConnection::call(std::string_view method,
                                                std::vector<Value> arguments) {
   if (!resumed_ || ended_ || interface_ == nullptr || object_ == nullptr) {
-    throw std::logic_error("a request on a connection that delivers none");
+    throw std::logic_error("request on a connection that was not resumed or has ended");
   }
   const InterfaceMethod& target = methodNamed(*interface_, method);
   if (countTypes(target.in) != arguments.size()) {

@@ -13,7 +13,8 @@
 namespace halvox::platform {
 
 // One request of a fake client and its answers. Shared by the test and the reply callback; any
-// thread may answer. Unlike the wire it keeps any number of answers, so that a test can count them.
+// thread may answer. A real connection sends only the first answer. This class keeps all of them,
+// so that a test can count them.
 class FakeCall {
  public:
   struct Reply {
@@ -54,11 +55,11 @@ class FakeConnection final : public NSXPCConnection {
       : journal_(journal), pid_(pid), user_(user) {}
 
   // Delivers a request to the exported object. Returns the call with the answers so far; later
-  // answers are added to it. A request that is for the owner is refused to a stranger. Throws if
-  // the connection was not resumed or has ended, if the object has no such method, or if the number
-  // of arguments is not that of the method's signature.
+  // answers are added to it. Answers with an error if a stranger calls a method for the owner.
+  // Throws if the connection was not resumed or has ended, if the object has no such method, or if
+  // the number of arguments is not that of the method's signature.
   std::shared_ptr<FakeCall> call(std::string_view method, std::vector<Value> arguments = {});
-  // The other end has disconnected, but the connection may be restored.
+  // Calls the interruption handler, as if the other end had disconnected and might come back.
   void interrupt();
   // Ends the connection: calls the invalidation handler once, then releases the exported object.
   void invalidate();
@@ -97,7 +98,7 @@ class FakeConnection final : public NSXPCConnection {
   std::shared_ptr<int> openRequests_ = std::make_shared<int>();  // each open request holds a copy
 };
 
-// A listener that accepts connections only when the test makes them.
+// A listener whose connections the test makes.
 class FakeListener final : public NSXPCListener {
  public:
   [[nodiscard]] NSXPCListenerDelegate* delegate() const { return delegate_; }

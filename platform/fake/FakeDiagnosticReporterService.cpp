@@ -67,7 +67,7 @@ void FakeDiagnosticReporterService::reply(std::size_t index, const Dictionary& r
     const std::lock_guard lock(requests_->mutex);
     reply = std::exchange(requests_->replies.at(index), nullptr);
   }
-  if (!reply) throw std::logic_error("the reply of this request has been given");
+  if (!reply) throw std::logic_error("this request has already been answered");
   reply(response);
 }
 

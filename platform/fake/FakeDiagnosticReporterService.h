@@ -14,7 +14,8 @@
 namespace halvox::platform {
 
 // A bug-capture service that captures nothing. It keeps the requests of its reporters, and the test
-// gives the replies. Any thread may call; the test calls on its own. FakePlatform owns it.
+// gives the replies. Any thread may call the service and its reporters; only the test's thread
+// calls the other functions. FakePlatform owns it.
 class FakeDiagnosticReporterService final : public DiagnosticReporterService {
  public:
   struct Request {
@@ -33,13 +34,13 @@ class FakeDiagnosticReporterService final : public DiagnosticReporterService {
   [[nodiscard]] std::size_t reportersMade() const;
   // All requests in order, answered or not.
   [[nodiscard]] std::vector<Request> requests() const;
-  // Gives the reply to the request of that index, on this thread. Throws if there is no such
+  // Calls the reply of the request with that index, on this thread. Throws if there is no such
   // request or it has been answered.
   void reply(std::size_t index, const Dictionary& response);
-  // The state of the service from the source that was set; none if there is no source, or if it did
-  // not answer before it returned.
+  // Asks the source for the state of the service and returns the answer; none if there is no
+  // source, or if the source does not answer before it returns.
   [[nodiscard]] std::optional<Dictionary> state() const;
-  // Asks the source for the state, for a source that answers later. Does nothing without a source.
+  // Passes the callback to the source, which may call it later. Does nothing without a source.
   void askState(std::function<void(const Dictionary& state)> callback) const;
 
   [[nodiscard]] std::shared_ptr<AILDiagnosticReporter> createReporter() override;

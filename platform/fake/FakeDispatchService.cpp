@@ -15,7 +15,7 @@ class RunningMark {
  public:
   explicit RunningMark(FakeDispatchQueue* queue) {
     // Running jobs inside a job would nest jobs of one queue, which no real queue does.
-    if (runningJob) throw std::logic_error("a job of the fake dispatch service pumped it");
+    if (runningJob) throw std::logic_error("a job called a function that runs jobs");
     runningJob = true;
     runningQueue = queue;
   }
@@ -65,12 +65,12 @@ bool FakeDispatchQueue::isCurrent() const { return runningQueue == this; }
 void FakeDispatchQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
                                std::optional<std::chrono::nanoseconds> timeout,
                                std::function<void(WaitOutcome)> then) {
-  if (!isCurrent()) throw std::logic_error("a wait began outside the jobs of its queue");
+  if (!isCurrent()) throw std::logic_error("waitOn() was called outside its queue's jobs");
   if (traits_.threading != QueueThreading::kShared) {
-    throw std::logic_error("a queue with a thread of its own was to wait");
+    throw std::logic_error("waitOn() was called on a queue with a thread of its own");
   }
   auto own = std::dynamic_pointer_cast<FakeDispatchSemaphore>(std::move(semaphore));
-  if (own == nullptr) throw std::logic_error("a semaphore of another service");
+  if (own == nullptr) throw std::logic_error("waitOn() needs a semaphore of this service");
   service_.beginWait({shared_from_this(), std::move(own), timeout, std::move(then)});
 }
 
@@ -80,7 +80,7 @@ void FakeDispatchSemaphore::wait() {
   const StandingMark standing;
   service_.setWaiting(standing.queue(), true);
   while (!service_.tryTakeSignal(*this)) {
-    if (!service_.runOne()) throw std::logic_error("nobody will signal the semaphore");
+    if (!service_.runOne()) throw std::logic_error("no job remains that could signal");
   }
   service_.setWaiting(standing.queue(), false);
 }
@@ -115,8 +115,8 @@ void FakeDispatchService::advance(std::chrono::nanoseconds by) {
   moveTimeTo(until);
 }
 
-// Moves time to the next delayed job or end of a wait. Returns false if there is none up to
-// `until`.
+// Moves time to the next delayed job or the next end of a wait, whichever is first, and carries
+// that out. Returns false if there is none up to `until`.
 bool FakeDispatchService::passNext(std::chrono::nanoseconds until) {
   std::chrono::nanoseconds time{};
   Job job;
@@ -254,7 +254,7 @@ void FakeDispatchService::add(std::shared_ptr<FakeDispatchQueue> queue, JobWeigh
 
 void FakeDispatchService::beginWait(Wait wait) {
   const std::lock_guard lock(mutex_);
-  if (wait.queue->isWaiting_) throw std::logic_error("a job began a second wait");
+  if (wait.queue->isWaiting_) throw std::logic_error("a job called waitOn() twice");
   wait.queue->isWaiting_ = true;
   if (wait.semaphore->signals_ > 0) {
     --wait.semaphore->signals_;

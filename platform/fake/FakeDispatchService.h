@@ -42,7 +42,7 @@ class FakeDispatchQueue final : public DispatchQueue,
   void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
               std::optional<std::chrono::nanoseconds> timeout,
               std::function<void(WaitOutcome)> then) override;
-  // Declines unless the test has allowed it. See FakeDispatchService::letThreadsEnter().
+  // Returns false unless the test has called FakeDispatchService::letThreadsEnter().
   [[nodiscard]] bool tryEnter() override;
   void leave() override;
   [[nodiscard]] bool isCurrent() const override;
@@ -78,8 +78,8 @@ class FakeDispatchSemaphore final : public DispatchSemaphore {
 //
 // Jobs run on the test's thread, and only when the test runs them: one at a time, in the order in
 // which they were added to any queue. Time stands still until the test advances it, and the fake
-// clock moves with it. The jobs of a queue that waits remain until its wait has ended, by a signal
-// or by time.
+// clock moves with it. The jobs of a queue that waits on a semaphore do not run until the wait has
+// ended, by a signal or by time.
 //
 // Any thread may add jobs and signal; one thread may run them. FakePlatform owns it. Misuse throws
 // std::logic_error.
@@ -89,21 +89,21 @@ class FakeDispatchService final : public DispatchService {
   explicit FakeDispatchService(FakeClockService& clock) : clock_(clock) {}
   ~FakeDispatchService() override;
 
-  // Runs the waiting jobs and those that they add, until only jobs of queues that wait remain.
-  // Delayed jobs remain, too.
+  // Runs the pending jobs and the jobs that these add. Does not run delayed jobs and jobs of queues
+  // that wait on a semaphore.
   void runUntilIdle();
   // Runs the oldest job that may run. Returns false if there is none.
   bool runOne();
-  // Lets time pass. Runs all waiting jobs; then each delayed job and the end of each wait at its
-  // time, with everything that follows from it. At equal times, delayed jobs run first. The clock
-  // shows the time of the job that runs.
+  // Lets time pass. First runs all pending jobs. Then runs each delayed job, and ends each wait, at
+  // its time, and after each of them the jobs that it adds. At equal times, delayed jobs run first.
+  // While a job runs, the clock shows its time.
   void advance(std::chrono::nanoseconds by);
   // Drops all jobs that have not run, and ends all waits without calling anything. If the
-  // destructor of a job adds a job, that is dropped too.
+  // destructor of a job adds a job, that job is dropped, too.
   void clear();
 
-  // From now on a thread may enter a shared queue that is idle. By default all queues decline,
-  // which is allowed, and every job waits until the test runs it.
+  // From now on tryEnter() succeeds for a shared queue that is idle. By default it fails for every
+  // queue, as the interface allows, and every job waits until the test runs it.
   void letThreadsEnter() { letsThreadsEnter_ = true; }
 
   [[nodiscard]] std::size_t waitingJobs() const;
@@ -147,7 +147,7 @@ class FakeDispatchService final : public DispatchService {
   [[nodiscard]] bool tryTakeSignal(FakeDispatchSemaphore& semaphore);
   [[nodiscard]] bool mayEnter(const FakeDispatchQueue& queue) const;
   void setWaiting(FakeDispatchQueue* queue, bool isWaiting);
-  // The caller holds the mutex. Lets the queue continue with `then`, ahead of its other jobs.
+  // The caller holds the mutex. Lets the queue continue with `then`, before its other jobs.
   void endWait(Wait wait, WaitOutcome outcome);
   [[nodiscard]] Waits::iterator firstToTimeOut();
   bool passNext(std::chrono::nanoseconds until);

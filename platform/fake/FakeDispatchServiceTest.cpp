@@ -206,7 +206,7 @@ TEST_F(FakeDispatchServiceTest, AnyThreadMayAddJobs) {
 
 class FakeDispatchWaitTest : public FakeDispatchServiceTest {
  protected:
-  // Adds a job that waits on the semaphore and notes the outcome.
+  // Adds a job that waits on the semaphore and records the outcome.
   Job waitOn(const std::shared_ptr<DispatchQueue>& queue,
              std::optional<std::chrono::nanoseconds> timeout) {
     return [this, &queue, timeout] {

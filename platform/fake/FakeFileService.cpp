@@ -91,7 +91,7 @@ void FakeFileService::step(std::string text) {
 std::optional<Error> FakeFileService::add(File file) {
   const std::lock_guard lock(mutex_);
   if (fileError_.has_value()) return fileError_;
-  if (!isFileName(file.name)) return Error{.description = "no name of a file: " + file.name};
+  if (!isFileName(file.name)) return Error{.description = "not a file name: " + file.name};
   const auto isInside = [&](const std::string& known) {
     return (known + "/").starts_with(file.directory + "/");
   };

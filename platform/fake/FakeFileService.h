@@ -15,7 +15,7 @@
 namespace halvox::platform {
 
 // Keeps directories and files in memory. A committed file has the path "/root<directory>/<name>".
-// Any thread may call; the test reads on its own. FakePlatform owns it.
+// Any thread may call the service; only the test's thread reads the results. FakePlatform owns it.
 class FakeFileService final : public FileService {
  public:
   struct File {
@@ -29,8 +29,8 @@ class FakeFileService final : public FileService {
   explicit FakeFileService(Journal& journal) : journal_(journal) {}
 
   // Makes the creation of directories, or the commit of files, fail with that error; none ends the
-  // failures. A directory that could not be made still counts as existing, so that a test can tell
-  // the two failures apart.
+  // failures. Files can be committed in a directory whose creation failed, so that a test can cause
+  // each failure alone.
   void setDirectoryError(std::optional<Error> error);
   void setFileError(std::optional<Error> error);
 

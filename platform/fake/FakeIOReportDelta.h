@@ -9,8 +9,8 @@ namespace halvox::platform {
 [[nodiscard]] bool areNamedAlike(const FakeIOReportService::Channel& one,
                                  const FakeIOReportService::Channel& other);
 
-// The change from one list to the other, as IOReportCreateSamplesDelta promises it. Computed apart
-// from the adapter's code, so that the contract suite compares two implementations.
+// The change from one list to the other, as IOReportCreateSamplesDelta promises it. Shares no code
+// with the adapter, so that the contract suite compares two implementations.
 [[nodiscard]] FakeIOReportService::ChannelList differences(
     const FakeIOReportService::ChannelList& previous,
     const FakeIOReportService::ChannelList& current);

@@ -45,7 +45,7 @@ std::optional<std::string_view> view(const std::optional<std::string>& text) {
 
 }  // namespace
 
-// The values of all groups when the first of them was sampled.
+// The values that all groups had when the first of them was sampled.
 class FakeIOReportService::ReadMoment final : public IOReportMoment {
  public:
   std::optional<Groups> groups;

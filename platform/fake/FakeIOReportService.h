@@ -13,7 +13,7 @@
 namespace halvox::platform {
 
 // Driver counters that the test sets. A group has a name such as "Speaker-(null)": group, "-" and
-// subgroup. Samples copy the values that the test set last, and differences are computed from them.
+// subgroup. Samples copy the values that the test set last. Differences are computed from samples.
 // Each operation is in the journal with its group. Any thread may call. FakePlatform owns it.
 class FakeIOReportService final : public IOReportService {
  public:

@@ -20,8 +20,8 @@ std::string hexadecimal(std::uint32_t number) {
 
 }  // namespace
 
-// Belongs to the code that sets it up and then to its queue. The service's lock guards the recorded
-// events and whether it records.
+// A session. It belongs to the code that sets it up, and after its start to its queue. The
+// service's lock guards the recorded events and the flag whether the session records.
 class FakeKtraceService::FakeSession final : public KtraceSession {
  public:
   enum class State : std::uint8_t { kMade, kStarted, kEnded, kDestroyed };

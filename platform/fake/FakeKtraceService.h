@@ -25,14 +25,14 @@ class FakeKtraceService final : public KtraceService {
   // Does not own the journal, which must outlive it.
   explicit FakeKtraceService(Journal& journal) : journal_(journal) {}
 
-  // Delivers to each session those of these events that are in its ranges, before the events that
-  // it recorded.
+  // Sets events that each session delivers before those that it has recorded, if they are in its
+  // ranges.
   void setEvents(std::vector<trace_point> events);
   // Emits an event: the sessions that record now keep it if it is in their ranges.
   void emit(const trace_point& event);
   void setNanosecondsPerTick(std::uint64_t nanoseconds) { setTimebase(nanoseconds, 1); }
-  // Sets how many nanoseconds that many ticks take. A conversion cuts fractions of a nanosecond
-  // off.
+  // Sets how many nanoseconds that many ticks take. A conversion discards fractions of a
+  // nanosecond.
   void setTimebase(std::uint64_t nanoseconds, std::uint64_t ticks);
   // Makes these calls fail with that error; 0 ends the failures.
   void failRange(int error);

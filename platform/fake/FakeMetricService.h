@@ -10,8 +10,8 @@
 
 namespace halvox::platform {
 
-// Keeps the metrics that were posted. Any thread may call; the test reads on its own. FakePlatform
-// owns it.
+// Keeps the metrics that were posted. Any thread may call the service; only the test's thread reads
+// the results. FakePlatform owns it.
 class FakeMetricService final : public MetricService {
  public:
   struct Metric {

@@ -55,7 +55,7 @@ std::optional<Error> FakeOverflowService::read(OverflowPlace place, std::span<st
   if (readError_.has_value()) return readError_;
   const auto found = pieces_.find(place.offset);
   if (found == pieces_.end() || found->second.size() != bytes.size()) {
-    throw std::logic_error("a read of a place that write() did not return");
+    throw std::logic_error("read() needs a place that write() returned");
   }
   std::ranges::copy(found->second, bytes.begin());
   return std::nullopt;
@@ -64,7 +64,7 @@ std::optional<Error> FakeOverflowService::read(OverflowPlace place, std::span<st
 void FakeOverflowService::release(OverflowPlace place) {
   const std::lock_guard lock(mutex_);
   if (pieces_.erase(place.offset) == 0) {
-    throw std::logic_error("a release of a place that is not valid");
+    throw std::logic_error("release() needs a place that write() returned");
   }
 }
 

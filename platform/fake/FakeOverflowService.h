@@ -11,17 +11,17 @@
 
 namespace halvox::platform {
 
-// Keeps bytes in memory. Any thread may call; the test sets errors and reads on its own.
-// FakePlatform owns it.
+// Keeps bytes in memory. Any thread may call the service; only the test's thread calls the other
+// functions. FakePlatform owns it.
 class FakeOverflowService final : public OverflowService {
  public:
   // 64 MiB at first.
   void setMemoryPerClient(std::size_t bytes);
-  // From now on writing, or reading, fails with that error; std::nullopt ends this.
+  // From now on writing, or reading, fails with that error; std::nullopt ends the failures.
   void setWriteError(std::optional<Error> error);
   void setReadError(std::optional<Error> error);
 
-  // Sets a byte of each piece that is long enough, as a damaged disk would.
+  // Changes the byte at `position` in each stored piece that is long enough, like a damaged disk.
   void damage(std::size_t position, std::byte value);
 
   // The bytes that were written and not released.

@@ -15,8 +15,8 @@
 namespace halvox::platform {
 
 // Performance traces that record nothing. They succeed unless the test decides otherwise. Jobs of
-// the service's own queue call the delegates: nothing is reported before the test runs jobs. The
-// journal has the calls that sessions receive. Any thread may call. FakePlatform owns it.
+// the service's own queue call the delegates. Nothing is therefore reported before the test runs
+// jobs. The journal has the calls that sessions receive. Any thread may call. FakePlatform owns it.
 class FakePerformanceTraceService final : public PerformanceTraceService {
  public:
   // Does not own its arguments, which must outlive it and its sessions.

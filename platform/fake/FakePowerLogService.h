@@ -11,7 +11,8 @@
 
 namespace halvox::platform {
 
-// Keeps the power events. Any thread may call; the test reads on its own. FakePlatform owns it.
+// Keeps the power events. Any thread may call the service; only the test's thread reads the
+// results. FakePlatform owns it.
 class FakePowerLogService final : public PowerLogService {
  public:
   struct Event {

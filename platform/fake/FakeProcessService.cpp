@@ -21,7 +21,7 @@ std::size_t characterLength(std::string_view text) {
   return length;
 }
 
-// Replaces bytes that are not UTF-8, as the port promises.
+// Replaces bytes that are not UTF-8, as ProcessRecord promises.
 std::string recordedName(std::string_view name) {
   constexpr std::size_t kLongestName = 15;
   name = name.substr(0, kLongestName);

@@ -52,7 +52,7 @@ std::optional<Value> FakePropertyListService::parse(const std::optional<Data>& b
   const auto read = bytes->bytes();
   if (read.size() == sizeof number) std::memcpy(&number, read.data(), sizeof number);
   if (number >= contents_.size() || !contents_[number].has_value()) {
-    error = Error{.description = "no property list"};
+    error = Error{.description = "not a property list"};
     return std::nullopt;
   }
   return contents_[number];

@@ -10,9 +10,9 @@
 
 namespace halvox::platform {
 
-// Property-list files that the test makes. The bytes of a file are the index of its content. Bytes
-// that were read before the file changed therefore still stand for the old content. Any thread may
-// call. FakePlatform owns it.
+// Property-list files that the test makes. The bytes of a file are the index of its content. If the
+// file changes, bytes that were read earlier are therefore still parsed as the old content. Any
+// thread may call. FakePlatform owns it.
 class FakePropertyListService final : public PropertyListService {
  public:
   // Makes the file contain a property list with that root.

@@ -15,15 +15,16 @@
 
 namespace halvox::platform {
 
-// A real-time framework without servers. It keeps what it was given, and the test decides how it
-// answers. At first every discovery finds no back-end and is answered when the test runs jobs,
-// every flush ends before the call returns, and every message is sent. Any thread may call; the
-// test decides and reads on its own. FakePlatform owns it.
+// A real-time framework without servers. It keeps the sessions and messages that it receives, and
+// the test decides how it answers. At first every discovery finds no back-end and is answered when
+// the test runs jobs, every flush ends before the call returns, and every message is sent. Any
+// thread may call the service; only the test's thread calls the other functions. FakePlatform owns
+// it.
 class FakeTlmReportingService final : public TLMReportingService {
  public:
   enum class Answering : unsigned char {
     kLater,            // by a job of its own, when the test runs jobs
-    kBeforeReturning,  // a discovery on another thread, a flush on this one
+    kBeforeReturning,  // discoveries on another thread, flushes on the caller's
     kWhenTold,
   };
 
@@ -76,7 +77,7 @@ class FakeTlmReportingService final : public TLMReportingService {
   Session TLMReportingCreateSession(const Dictionary& sessionInfo,
                                     const Dictionary& userInfo) override;
   void TLMReportingStartConfiguration(const Session& session, BackendsCallback found) override;
-  // Sets whether sends count as cheap. By default they do not.
+  // Sets the result of onlyNotesMessages(), which is false at first.
   void setOnlyNotesMessages(bool onlyNotes) { onlyNotesMessages_ = onlyNotes; }
   [[nodiscard]] bool onlyNotesMessages() const override { return onlyNotesMessages_; }
   TLMReportingOutcome TLMReportingSendMessage(const Session& session,

@@ -104,7 +104,7 @@ TYPED_TEST_P(AnalyticsContract, PayloadIsBuiltOnceAndNotWithinTheSending) {
 
 TYPED_TEST_P(AnalyticsContract, BuilderSeesWhatChangedAfterTheSending) {
   const auto gate = std::make_shared<std::atomic<std::int64_t>>(0);
-  // The builder waits for the change, which this thread makes after sending.
+  // The builder waits until this thread changes `gate`, which happens after the sending.
   this->harness_.service().sendAnalyticsEventLazy("e", [gate] {
     while (*gate == 0) std::this_thread::yield();
     return Dictionary{{"number", gate->load()}};

@@ -7,8 +7,8 @@
 
 namespace halvox::platform::contract {
 
-// Lets jobs run until all that were added to the queue before have run. Returns false if they never
-// do. `Harness` is that of DispatchContract.
+// Lets jobs run until every job that was added to the queue before this call has run. Returns false
+// if that never happens. `Harness` is that of DispatchContract.
 template <typename Harness>
 [[nodiscard]] bool drainBy(Harness& harness, DispatchQueue& queue) {
   const auto done = std::make_shared<std::atomic<bool>>(false);

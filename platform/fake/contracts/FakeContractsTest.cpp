@@ -1,4 +1,4 @@
-// The contracts of the ports, run on the fakes.
+// The contracts of the platform services, run on the fakes.
 
 #include <atomic>
 #include <chrono>

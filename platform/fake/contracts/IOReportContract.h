@@ -180,7 +180,7 @@ TYPED_TEST_P(IOReportContract, SamplesStayAsTheyWere) {
   EXPECT_THAT(this->show(samples), ElementsAre("Amp<1>/Speaker/Stats/pulses 7 pulses"));
 }
 
-// Must hold however soon one session follows another.
+// This must hold even if one session follows another at once.
 TYPED_TEST_P(IOReportContract, NoReadingIsUsedThatIsOlderThanTheMoment) {
   this->harness_.set({this->counter(0)});
   this->subscribe("Speaker");
@@ -339,7 +339,8 @@ TYPED_TEST_P(IOReportContract, TheExtremesOfADifferenceAreThoseOfTheBucketsThatG
 
   EXPECT_THAT(extremes({5, 1, 2}, {5, 3, 2}), ElementsAre(10, 20));
   EXPECT_THAT(extremes({5, 1, 2}, {6, 2, 2}), ElementsAre(0, 20));
-  // An open bucket is known by its lower bound.
+  // The maximum is the upper bound of the highest bucket with new hits, or the lower bound of that
+  // bucket if it is open.
   EXPECT_THAT(extremes({5, 1, 2}, {5, 2, 3}), ElementsAre(10, 20));
   EXPECT_THAT(extremes({5, 1, 2}, {5, 1, 3}), ElementsAre(20, 20));
   EXPECT_THAT(extremes({5, 1, 2}, {5, 1, 2}), ElementsAre(0, 0));

@@ -98,7 +98,8 @@ class KtraceContract : public ::testing::Test {
     ASSERT_TRUE(harness_.letRunUntil([&] { return seen.completions > 0; }));
     EXPECT_FALSE(seen.isElsewhere);
   }
-  // The whole life of another session. After it, no job of an earlier session can be pending.
+  // Creates, starts and ends another session. After that, no job of an earlier session can be
+  // pending.
   void letLifePass() {
     Seen other;
     const auto session = create(other);
@@ -112,7 +113,7 @@ class KtraceContract : public ::testing::Test {
 };
 TYPED_TEST_SUITE_P(KtraceContract);
 
-// --- What does not suit the state ---------------------------------------------------------------
+// --- Calls that the state does not allow --------------------------------------------------------
 
 TYPED_TEST_P(KtraceContract, NoSessionIsHarmless) {
   KtraceService& service = this->service();

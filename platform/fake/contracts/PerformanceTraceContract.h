@@ -94,7 +94,8 @@ class PerformanceTraceContract : public ::testing::Test {
     EXPECT_EQ(listener->heard(), texts);
     return isHeard;
   }
-  // Starts another trace. Its outcome comes after the outcomes of all earlier calls.
+  // Starts another trace and waits for its outcome, which comes after the outcomes of all earlier
+  // calls.
   void letWorkPass() {
     const auto other = std::make_shared<Listener>();
     const Session session = create(other);

@@ -114,7 +114,7 @@ TYPED_TEST_P(TlmReportingContract, ADiscoveryIsAnsweredLaterAndNotFromInsideTheC
   EXPECT_EQ(discovery->backends.has_value(), TypeParam::kFindsBackends);
 }
 
-// Must also hold for a framework that remembers the result of the first discovery.
+// This must also hold for a framework that remembers the result of the first discovery.
 TYPED_TEST_P(TlmReportingContract, LaterDiscoveriesAreNotAnsweredFromInsideTheCallEither) {
   const auto session = this->openSession(1);
 
