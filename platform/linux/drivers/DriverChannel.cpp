@@ -23,7 +23,7 @@ std::size_t ChannelDescription::valueCount() const {
 std::string ChannelDescription::fullName() const {
   std::string name = std::to_string(static_cast<int>(format));
   for (const auto* part : {&driverName, &group, &subGroup, &channelName}) {
-    // The lengths keep the result unique: a name may contain the separators.
+    // The lengths keep the result unique, because a name may contain the separators.
     name += part->has_value() ? '\n' + std::to_string((*part)->size()) + ':' + **part : "\n-";
   }
   return name;

@@ -23,7 +23,8 @@ struct BucketBounds {
 // readings.
 struct ChannelDescription {
   IOReportFormat format = IOReportFormat::kSimple;
-  // For a simple channel. A gauge is the default: when a gauge falls, this never counts as a reset.
+  // Only for a simple channel. The default is the gauge, because a fall of a gauge never counts as
+  // a reset.
   IOReportKind kind = IOReportKind::kGauge;
   std::optional<std::string> driverName{};
   std::optional<std::string> group{};
@@ -41,8 +42,8 @@ struct ChannelDescription {
   friend bool operator==(const ChannelDescription&, const ChannelDescription&) = default;
 };
 
-// The channels of one source in order, and where the values of each begin in a reading. Immutable.
-// Readings share it: each reading then stores only its numbers.
+// The channels of one source in order, and the position in a reading at which the values of each
+// channel begin. Immutable. Readings share a list and store only their own numbers.
 class ChannelList {
  public:
   using Channel = std::shared_ptr<const ChannelDescription>;
@@ -67,7 +68,8 @@ class ChannelList {
 struct Reading {
   std::shared_ptr<const ChannelList> channels;
   std::vector<std::uint64_t> values;
-  // While it exists, the source knows that a reading is held. May be null.
+  // A source that must know whether any of its readings is held keeps a weak pointer to this
+  // object. May be null.
   std::shared_ptr<void> lease{};
 };
 

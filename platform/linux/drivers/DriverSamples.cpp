@@ -110,7 +110,8 @@ ValuesByChannel index(const DriverSamples& samples) {
   return values;
 }
 
-// Limit the difference to what 64 bits hold: one that wrapped around would turn a fall into a rise.
+// Limit the difference to what 64 bits hold, because a difference that wraps around would turn a
+// fall into a rise.
 std::uint64_t gaugeDifference(std::uint64_t previous, std::uint64_t current) {
   std::int64_t difference = 0;
   if (__builtin_sub_overflow(asSigned(current), asSigned(previous), &difference)) {

@@ -31,9 +31,10 @@ class DriverSamples final : public IOReportSamples {
   const std::vector<Part> parts_;
 };
 
-// The change from one to the other, of the channels that are in both. A channel that is only in one
-// of them has no known start value. This includes the channels of a source that was late. The
-// differences are those that IOReportCreateSamplesDelta promises.
+// The change from `previous` to `current`, of the channels that are in both. A channel that is only
+// in one of them is skipped, because its start or end value is unknown. This also concerns the
+// channels of a source that was late for one of them. The differences are those that
+// IOReportCreateSamplesDelta promises.
 [[nodiscard]] std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
                                                              const DriverSamples& current);
 

@@ -9,9 +9,9 @@ namespace halvox::platform::linux_ {
 
 // A source of driver counters.
 //
-// Its SourceReader owns it and calls it on a thread that serves only this source: a source that
-// waits for a disk or a driver then delays no other source. A failure makes a reading smaller; the
-// source logs it.
+// Its SourceReader owns it and calls it on a thread that serves only this source. A source that
+// waits for a disk or a driver therefore delays no other source. If a source cannot read something,
+// it logs that and skips it in the reading.
 class DriverSource {
  public:
   DriverSource() = default;
@@ -28,8 +28,8 @@ class DriverSource {
   // be read is skipped and logged by the source.
   [[nodiscard]] virtual std::shared_ptr<const Reading> read() = 0;
   // Reports that the last reading was a sample of a session. Not called for readings that only find
-  // out which channels exist. Called after the reading was handed over, which means that no session
-  // waits for this call.
+  // out which channels exist. Called after the waiting threads have received the reading. No
+  // session therefore waits for this call.
   virtual void sampled() {}
 };
 

@@ -15,8 +15,8 @@ namespace {
 using Readers = std::vector<std::unique_ptr<SourceReader>>;
 using Readings = std::vector<std::shared_ptr<const Reading>>;  // by source; null: late
 
-// Asks all sources first and takes the readings afterwards: the wait is then that of the slowest
-// source and not the sum.
+// Requests the readings of all sources before it waits for the first. It then waits only as long as
+// the slowest source takes, and not for the sum.
 Readings read(const Readers& readers, std::chrono::milliseconds longestWait,
               SourceReader::Use use) {
   std::vector<SourceReader::Asked> asked;
@@ -95,7 +95,8 @@ class GroupChannels final : public IOReportChannels {
   mutable std::vector<Found> found_ HALVOX_GUARDED_BY(mutex_);  // by source
 };
 
-// Empty, because the set of channels has all that is needed. The port requires the object.
+// Empty, because the set of channels has everything that a sample needs. IOReportService requires
+// the object.
 class GroupSubscription final : public IOReportSubscription {};
 
 // Reads the sources when the first sample is requested: a moment without samples costs nothing.
@@ -136,16 +137,16 @@ LinuxIOReportService::LinuxIOReportService(std::vector<std::unique_ptr<DriverSou
 LinuxIOReportService::~LinuxIOReportService() = default;
 
 void LinuxIOReportService::open() {
-  // Start all sources at once: the start of the service then waits for the slowest source and not
-  // for the sum.
+  // Start to open all sources before waiting for the first. The start of the service then waits
+  // only as long as the slowest source takes, and not for the sum.
   for (const auto& reader : readers_) reader->startOpening();
   for (const auto& reader : readers_) reader->waitUntilOpen();
 }
 
 IOReportService::Channels LinuxIOReportService::IOReportCopyChannelsInGroup(
     Name group, Name subGroup, std::optional<IOReportError>& /*error*/) {
-  // A channel that is missed here is missing until the service restarts. This may therefore take
-  // longer than a sample.
+  // A channel that is missed here is missing until the service restarts. The search may therefore
+  // take longer than a sample.
   const Readings readings = read(readers_, std::max(longestWait_, SourceReader::kLongestOpening),
                                  SourceReader::Use::kFindChannels);
   GroupName names{std::optional<std::string>(group), std::optional<std::string>(subGroup)};
@@ -175,8 +176,9 @@ IOReportService::Samples LinuxIOReportService::IOReportCreateSamples(
   const Readings& readings = static_cast<ReadMoment&>(moment).readings();
   std::vector<DriverSamples::Part> parts;
   for (std::size_t source = 0; source < readings.size(); ++source) {
-    // A source that is late is missing from the samples. A difference then has none of its
-    // channels. Counting from zero instead would report everything since the driver was loaded.
+    // The samples do not have the channels of a source that is late, and a difference then does not
+    // have them either. Taking zero as their value instead would report everything since the driver
+    // was loaded.
     if (readings[source] == nullptr) continue;
     DriverSamples::Part part = group.select(source, readings[source]);
     if (!part.selection->empty()) parts.push_back(std::move(part));

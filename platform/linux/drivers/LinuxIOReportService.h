@@ -12,12 +12,12 @@
 
 namespace halvox::platform::linux_ {
 
-// Reports what the kernel, the sound server and other daemons count as driver channels.
+// Provides driver channels with what the kernel, the sound server and other daemons count.
 //
-// A set of channels has those that exist when the set is requested, and a subscription never gets
-// more. A channel that disappears and appears again is sampled again; its names and its format
-// identify it. If a source takes longer than `SourceReader::kLongestOpening` to open, the sets that
-// are requested before it has opened do not have its channels.
+// A set has the channels that exist when the set is requested, and a subscription to it never gets
+// others. A channel that disappears and appears again with the same names and format is sampled
+// again. If a source takes longer than `SourceReader::kLongestOpening` to open, sets that are
+// requested earlier do not have its channels.
 //
 // Threads: any thread may use it. A sample blocks for at most the longest wait, for all sources
 // together; a source that is late is skipped. Looking for channels, which the service does only

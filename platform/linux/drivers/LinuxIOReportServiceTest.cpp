@@ -95,7 +95,7 @@ class LinuxIOReportServiceTest : public ::testing::Test {
   Gate gate_;
   // Call before serve(). The default is long enough that no reading is late on a busy machine.
   std::chrono::milliseconds longestWait_ = 10s;
-  // For tests in which one source is late: each costs this time once.
+  // For tests in which one source is late. Each of them takes this time once.
   static constexpr std::chrono::milliseconds kShortWait = 1s;
   std::unique_ptr<LinuxIOReportService> service_;
 };

@@ -18,8 +18,8 @@ bool isListOf(const ChannelList& list, const std::vector<ChannelList::Channel>& 
 void ReadingMaker::add(const std::string& name, ChannelDescription description,
                        std::span<const std::uint64_t> values) {
   const auto found = known_.find(name);
-  // Use the same object as in the last reading if nothing has changed: differences compare
-  // addresses.
+  // If nothing has changed, use the same object as in the last reading, because differences
+  // identify channels by address.
   Channel channel = found != known_.end() && *found->second == description
                         ? found->second
                         : std::make_shared<const ChannelDescription>(std::move(description));
@@ -33,7 +33,8 @@ void ReadingMaker::add(Channel channel, std::span<const std::uint64_t> values) {
 }
 
 std::shared_ptr<const Reading> ReadingMaker::finish(std::shared_ptr<void> lease) {
-  // Share the list: a set of channels can then keep the positions that it has computed.
+  // Share the list of the last reading. A set of channels can then keep the positions that it has
+  // computed.
   if (list_ == nullptr || !isListOf(*list_, channels_)) {
     list_ = std::make_shared<const ChannelList>(channels_);
   }

@@ -12,7 +12,7 @@ std::string pieceOf(const DriverSource& source) {
 
 }  // namespace
 
-// The counters balance: requested = given + skipped.
+// The counters must balance: readings asked for = given + skipped.
 SourceReader::SourceReader(std::unique_ptr<DriverSource> source, LogCategory& log,
                            StatisticsService& statistics, std::chrono::milliseconds longestWait)
     : source_(std::move(source)),
@@ -94,13 +94,14 @@ SourceReader::ReadingPointer SourceReader::waitFor(std::uint64_t number,
   bool inTime = true;
   while (lastMade_ < number && inTime) inTime = made_.waitUntil(mutex_, deadline);
   ReadingPointer reading = lastMade_ < number ? nullptr : handedOver_;
-  // No other thread will take the reading, and a reading that is held keeps its source at work.
+  // Release the reading when no other thread will take it, because a source may do work as long as
+  // its reading is held.
   if (--waiting_ == 0) handedOver_.reset();
   return reading;
 }
 
 void SourceReader::run() {
-  // Open it on this thread: all sources then open at the same time.
+  // Open the source on this thread, so that all sources open at the same time.
   source_->open();
   const MutexLock lock(mutex_);
   makeReadings();
@@ -114,20 +115,21 @@ void SourceReader::makeReadings() {
     const bool isSample = std::exchange(isSampleWanted_, false);
     mutex_.unlock();
     const Clock::time_point start = Clock::now();
-    // Read without the lock: other threads can then request the next reading meanwhile.
+    // Read without the lock, so that other threads can request the next reading meanwhile.
     ReadingPointer reading = source_->read();
     const Clock::duration time = Clock::now() - start;
     mutex_.lock();
-    // Decide by the time that the reading took, and not by whether a waiting thread received it: no
-    // thread waits for a late source.
+    // Decide by the time that the reading took. Whether a thread received it in time would say
+    // nothing, because no thread waits for a late source.
     if (time <= longestWait_) isLate_ = false;
     lastMade_ = lastBegun_;
-    // Hand it over also to threads that wait for the next reading, which will replace this one.
+    // Store the reading if any thread waits, even if that thread waits for the next one, which will
+    // replace this one.
     if (waiting_ > 0) std::swap(handedOver_, reading);
     made_.notifyAll();
     mutex_.unlock();
-    // Release the reading without the lock: its destructor may call the source, which must not
-    // delay threads with requests.
+    // Release the replaced or unused reading without the lock: its destructor may call the source,
+    // which must not delay threads with requests.
     reading.reset();
     if (isSample) source_->sampled();
     mutex_.lock();

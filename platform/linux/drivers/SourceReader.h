@@ -28,11 +28,11 @@ class SourceReader {
  public:
   using Clock = std::chrono::steady_clock;
 
-  // The start and the stop of a session wait this long on the reporting queue, and all other
-  // clients wait with them.
+  // The start and the stop of a session wait at most this long for a reading. They wait on the
+  // reporting queue, and all other clients wait with them.
   static constexpr std::chrono::milliseconds kLongestWait{50};
-  // Applies once, when the service starts. A channel that is missed then is missing until the next
-  // start.
+  // How long the service waits for a source once, when it starts. A channel that is missed then is
+  // missing until the next start.
   static constexpr std::chrono::milliseconds kLongestOpening{1000};
 
   // `log` and `statistics` must outlive the reader. `longestWait` is the time that a reading may
@@ -60,9 +60,9 @@ class SourceReader {
   // Requests a reading, which may take `wait`. Does not block: several sources can read at the same
   // time.
   [[nodiscard]] Asked ask(std::chrono::milliseconds wait, Use use);
-  // Waits for the requested reading. Returns null if it does not arrive in time, and logs the first
-  // time in a row. After that the source is still read, but no thread waits for it until a reading
-  // has been in time again.
+  // Waits for the requested reading. Returns null if it does not arrive in time, and logs only the
+  // first of several late readings in a row. The source is still read afterwards, but no thread
+  // waits for it until a reading has been in time again.
   [[nodiscard]] std::shared_ptr<const Reading> take(const Asked& asked);
 
  private:

@@ -21,9 +21,8 @@ class NoKdebugService final : public KdebugService {
 // Emits trace points as LTTng events "halvox:kdebug" with the fields code and arg1 to arg4.
 //
 // The LTTng provider is a module that is loaded at run time. LTTng then has two threads in the
-// process. They sleep until a session daemon starts, which costs no wake-up, and a daemon that
-// starts later also finds the service. Loading does not wait for a daemon, not even for one that
-// hangs.
+// process. They sleep until a session daemon starts and cause no wake-ups. A daemon that starts
+// later also finds the service. Loading does not wait for a daemon, not even for one that hangs.
 //
 // Any thread may call. The platform owns it. The module stays loaded until the process ends,
 // because LTTng's threads need it. If it cannot be loaded, the platform logs that and uses

@@ -25,11 +25,11 @@ std::filesystem::path modulePath(const Module& module) {
   const auto program = std::filesystem::read_symlink("/proc/self/exe", error);
   const auto directory = program.parent_path();
   auto beside = directory / module.file;
-  // A build that is not installed has its modules beside the program. They take precedence over
-  // installed ones, which may be of another build.
+  // A build that is not installed has its modules in the directory of the program. They take
+  // precedence over installed ones, which may be of another build.
   if (std::filesystem::exists(beside, error)) return beside;
-  // The path is relative to the program: an installation that was moved as a whole still finds its
-  // modules.
+  // The path is relative to the program, so that an installation that was moved as a whole still
+  // finds its modules.
   return (directory / HALVOX_MODULES_FROM_PROGRAM / module.file).lexically_normal();
 }
 

@@ -16,7 +16,8 @@ struct Module {
   const char* entryPoint;
 };
 
-// Where the module is: beside the program, as in a build tree, or else where it is installed.
+// The path of the module: in the program's directory if the module is there, as in a build tree,
+// otherwise where it is installed.
 [[nodiscard]] std::filesystem::path modulePath(const Module& module);
 
 // Loads the module and returns the address of its entry point, or why it cannot be loaded. The

@@ -10,13 +10,14 @@
 namespace halvox::pipewire {
 namespace {
 
-// The stages of a node's work in a cycle, as the profiler numbers them. A node that was not even
-// called is not late itself: it waits for another node that is late.
+// The stages of a node's work in a cycle, as the profiler numbers them. A node that has not been
+// called is not late itself, but waits for another node that is late.
 constexpr std::int32_t kCalled = 1;
 constexpr std::int32_t kAwake = 2;
 constexpr std::int32_t kFinished = 3;
 
-// No device works in longer cycles. A driver that reports a longer one is not an audio clock.
+// The longest plausible cycle: no device works in longer ones, and a driver that reports one is not
+// an audio clock.
 constexpr std::chrono::duration<double> kLongestCycle{10};
 
 bool readClock(const spa_pod& value, ProfiledCycle& cycle) {

@@ -18,8 +18,8 @@ struct Global {
   const spa_dict* properties;  // may be null
 };
 
-// Receives what a server says, on the loop's thread. No call may disconnect the connection that
-// makes it, because the library still uses it then.
+// Receives the events of a server, on the loop's thread. No function may disconnect the connection
+// that calls it, because the library still uses the connection then.
 class ServerListener {
  public:
   ServerListener() = default;
@@ -49,7 +49,7 @@ class ServerListener {
 // thread.
 class ServerConnection {
  public:
-  // Neither is owned; both must outlive the connection.
+  // Owns neither argument; both must outlive the connection.
   ServerConnection(pw_context* context, ServerListener& listener)
       : context_(context), listener_(listener) {}
   ~ServerConnection() { disconnect(); }
@@ -65,8 +65,8 @@ class ServerConnection {
 
   // The registry through which objects are bound. Call only when connected.
   [[nodiscard]] pw_registry* registry() const { return registry_.get(); }
-  // Requests an answer, which calls onAnswered() after everything that the server has sent before
-  // it. Call only when connected.
+  // Requests an answer. onAnswered() is called for it after all events that the server has sent
+  // before the answer. Call only when connected.
   void requestAnswer();
 
  private:

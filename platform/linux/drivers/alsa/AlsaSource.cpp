@@ -28,7 +28,7 @@ std::optional<unsigned> numberAfter(std::string_view name, std::string_view lett
 
 std::vector<std::string> namesIn(int directory) {
   std::vector<std::string> names;
-  // Use a copy, because closing the stream also closes its descriptor.
+  // Use a copy of the descriptor, because closing the stream also closes its descriptor.
   UniqueFd own(::fcntl(directory, F_DUPFD_CLOEXEC, 0));
   const Directory stream(::fdopendir(own.get()));
   if (!stream) return names;
@@ -61,7 +61,7 @@ std::vector<std::string> pcmStates() { return {kPcmStates.begin(), kPcmStates.en
 
 std::shared_ptr<const Reading> AlsaSource::read() {
   ++round_;
-  // Read the clock once for all channels: their times can then be compared.
+  // Read the clock once for all channels, so that their times can be compared.
   time_ = now_();
   const UniqueFd asound = openDirectory((root_ / "proc/asound").c_str());
   if (asound) {

@@ -32,7 +32,7 @@ class AlsaSource final : public DriverSource {
   static constexpr std::size_t kMostChannels =
       4000;  // of all cards; far more than real machines have
 
-  // `now` is called once for each reading: all its channels then have the same time.
+  // `now` is called once for each reading, so that all its channels have the same time.
   explicit AlsaSource(std::filesystem::path root,
                       std::function<Clock::time_point()> now = Clock::now)
       : root_(std::move(root)), now_(std::move(now)) {}

@@ -21,7 +21,8 @@ void PcmCounters::look(const PcmStatus& status, Clock::time_point now) {
 
 void PcmCounters::count(Pointer& pointer, std::uint64_t now, bool isNewStream) {
   const std::uint64_t before = isNewStream ? 0 : pointer.last;
-  // An application may rewind its pointer. The frames count when it writes them again.
+  // An application may rewind its pointer. The frames that it then writes again are not counted a
+  // second time.
   if (now < before) return;
   pointer.total += now - before;
   pointer.last = now;

@@ -12,8 +12,8 @@ namespace halvox::platform::linux_ {
 // Counts one PCM substream across its streams: the kernel's pointers restart with each stream, and
 // the counts here continue.
 //
-// The kernel keeps no history. A state counts from the reading that found it to the reading that
-// finds another one. What happens between two readings and leaves no trace is not counted. Belongs
+// The kernel keeps no history. A state counts from the reading that finds it to the first reading
+// that finds another one. States that begin and end between two readings are not counted. Belongs
 // to the source's thread.
 class PcmCounters {
  public:

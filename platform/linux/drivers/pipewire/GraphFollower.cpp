@@ -126,10 +126,10 @@ bool GraphFollower::isLeased() {
 }
 
 void GraphFollower::proceed() {
-  // Disable the timer: it would cause a second attempt.
+  // Disable the timer, because it would cause a second attempt.
   proceedAfter(std::nullopt);
   const bool isWanted = isLeased();
-  // Disconnect first: everything below would otherwise use the connection that has ended.
+  // Disconnect first, because everything below would otherwise use the connection that has ended.
   if (std::exchange(isLost_, false)) {
     disconnect();
     if (isWanted) {
@@ -207,8 +207,8 @@ void GraphFollower::updateProfiler(bool isWanted) {
   if (isWanted && isPossible && profiler_ == nullptr) {
     {
       const MutexLock lock(graph_.mutex);
-      // Do this before binding: what the driver has counted until now must not count for this
-      // session.
+      // Do this before binding, because what the driver has counted until now must not count for
+      // this session.
       graph_.statistics.profilingBegan();
     }
     profiler_ = std::make_unique<pipewire::ProfilerBinding>(
@@ -242,7 +242,7 @@ void GraphFollower::onServerReached(const pw_core_info& server) {
 void GraphFollower::onServerLost() {
   isLost_ = true;
   log_.notice("the connection to PipeWire ended; waiting for the server while sessions run");
-  // Let the timer's callback disconnect: the library does not allow that inside this call.
+  // Let the timer's callback disconnect, because the library does not allow that inside this call.
   proceedAfter(Clock::duration::zero());
 }
 

@@ -27,7 +27,7 @@ namespace halvox::platform::linux_ {
 // PipeWireDriverSource says when a server is searched for.
 class GraphFollower final : private pipewire::ServerListener {
  public:
-  // All three must outlive it.
+  // Does not own its arguments, which must outlive it.
   GraphFollower(pw_loop* loop, SharedGraph& graph, LogCategory& log);
   ~GraphFollower() override;
 

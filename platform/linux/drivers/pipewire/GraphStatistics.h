@@ -21,8 +21,8 @@ namespace halvox::platform::linux_ {
 // Nodes are identified by the server's IDs; an ID that is used again is another node. When a node
 // disappears, its channels do too. When a node of the same class and name appears, on this server
 // or the next, it gets the same channels and their counts continue. A session therefore does not
-// lose what was counted before. This is only possible because the counts are made here and not by
-// the server.
+// lose what was counted before. Counts can continue on another server because they are made here
+// and not by the server.
 //
 // It uses neither PipeWire nor a clock, and its tests need neither: the caller passes events and
 // times. Not thread-safe; SharedGraph owns and guards it. Cannot fail.
@@ -40,7 +40,7 @@ class GraphStatistics {
   void serverReached() { ++connections_; }
   // The connection has ended, and with it all nodes have disappeared.
   void serverLost(Time now);
-  // The profiler begins to report cycles. Those before this call were not reported.
+  // The profiler begins to report cycles. Cycles before this call were not reported.
   void profilingBegan();
 
   // Returns false if the node is neither sink nor source, or if there are kMostNodes already. The

@@ -62,7 +62,8 @@ std::vector<std::string> StateResidency::names() { return {"running", "idle", "s
 void StateResidency::change(std::optional<NodeState> state, Time now) {
   if (isKnown_ && state == state_) return;
   if (state_.has_value()) totals_[static_cast<std::size_t>(*state_)].time += now - since_;
-  // Do not count the first known state as a transition: the node may have been in it for hours.
+  // Do not count the first known state as a transition, because the node may have been in it for
+  // hours.
   if (state.has_value() && isKnown_) ++totals_[static_cast<std::size_t>(*state)].transitions;
   state_ = state;
   since_ = now;

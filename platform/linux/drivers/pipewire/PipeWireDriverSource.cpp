@@ -13,8 +13,9 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Wakes the loop from any thread; does nothing after the loop has been destroyed. Shared by the
-// source and the leases, because a session may hold its snapshot longer than the source exists.
+// Wakes the loop from any thread. Does nothing after remove(), which must come before the
+// destruction of the loop. Shared by the source and the leases, because a session may hold its
+// snapshot longer than the source exists.
 class Bell {
  public:
   void install(pw_loop* loop, spa_source* event) {
@@ -34,7 +35,8 @@ class Bell {
   spa_source* event_ HALVOX_GUARDED_BY(mutex_) = nullptr;
 };
 
-// Held by readings. Rings when the last of them is destroyed, and the profiler is then released.
+// All held readings share one lease. When the last of them is destroyed, the lease rings the bell,
+// and the woken loop releases the profiler.
 class Lease {
  public:
   explicit Lease(std::shared_ptr<Bell> bell) : bell_(std::move(bell)) {}
@@ -55,11 +57,11 @@ class PipeWireDriverSource::Impl {
     pw_init(nullptr, nullptr);
   }
   ~Impl() {
-    // Do this first: leases may outlive this object and must not ring a loop that ends.
+    // Do this first: leases may outlive this object and must not wake a loop that ends.
     bell_->remove();
     if (loop_ != nullptr) pw_thread_loop_stop(loop_);
-    // Destroy it after the thread has stopped, because the connection's objects belong to the
-    // thread.
+    // Destroy the follower after the thread has stopped, because the connection's objects belong to
+    // the thread.
     connection_.reset();
     if (event_ != nullptr) pw_loop_destroy_source(pw_thread_loop_get_loop(loop_), event_);
     if (loop_ != nullptr) pw_thread_loop_destroy(loop_);
@@ -87,7 +89,7 @@ class PipeWireDriverSource::Impl {
     std::shared_ptr<void> lease;
     {
       const MutexLock lock(graph_.mutex);
-      // All readings share one lease: the profiler is bound while any reading is held.
+      // All readings share one lease, because the profiler is bound while any reading is held.
       lease = graph_.lease.lock();
       if (lease == nullptr) {
         lease = std::make_shared<Lease>(bell_);
@@ -117,7 +119,7 @@ class PipeWireDriverSource::Impl {
     if (!connection_->isUsable()) return false;
     event_ = pw_loop_add_event(loop, &Impl::onRing, this);
     if (event_ == nullptr || pw_thread_loop_start(loop_) != 0) return false;
-    // Set this last: only a loop that runs can be woken.
+    // Install the loop last, because only a loop that runs can be woken.
     bell_->install(loop, event_);
     return true;
   }

@@ -37,9 +37,9 @@ PipeWireOnDemand::PipeWireOnDemand(LogCategory& log)
                    makeChannel(describeNodeChannel(kSourceGroup, "pipewire", "connections"))} {}
 
 void PipeWireOnDemand::open() {
-  // Load the module now if there is a socket. Also try if the module is missing: the error is then
-  // logged at the start, and not during a session. Otherwise the first session loads the module: to
-  // wait for a server, the service would have to watch for its socket all the time.
+  // Load the module now if a socket exists. Also try to load it if its file is missing, so that the
+  // error is logged at the start and not during a session. Otherwise the first session loads the
+  // module, because waiting for a server would mean watching for its socket all the time.
   if (hasServerSocket() || !isModuleThere()) load(kLongestOpening);
 }
 
@@ -54,10 +54,10 @@ std::shared_ptr<const Reading> PipeWireOnDemand::read() {
 
 void PipeWireOnDemand::sampled() {
   if (source_ != nullptr || isDisabled_) return;
-  // Do not wait for the server: other sessions' samples would wait, too.
+  // Do not wait for the server, because the samples of other sessions would wait, too.
   load(std::chrono::milliseconds::zero());
   if (source_ == nullptr) return;
-  // While no session holds a reading, the source need not follow the server.
+  // If no session holds a reading, the source need not follow the server.
   if (const std::shared_ptr<Lease> lease = lease_.lock()) lease->ofLoaded = source_->read();
 }
 

@@ -10,8 +10,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Bounds for what one file can make a report contain; real state sets and histograms are far
-// smaller.
+// Limits for what one file can add to a report. Real state sets and histograms are far smaller.
 constexpr std::size_t kMostStates = 64;
 constexpr std::size_t kMostBuckets = 256;
 
@@ -109,7 +108,7 @@ class ChannelMaker {
     return nullptr;
   }
 
-  // The counters of a state set become part of its channel, not channels of their own.
+  // The counters of a state set become part of its channel. They get no channels of their own.
   void claimStateCounters(const MetricFamily& family) {
     if (family.type != MetricType::kStateset) return;
     // A missing counter inserts null, which is not the address of any family. addStateChannel()

@@ -32,8 +32,8 @@ struct MetricChannel {
 // may call them.
 class MetricChannels {
  public:
-  // The channels, or the first error. A text with a contradiction gives no channel at all: half of
-  // a file would be reported as if it were complete.
+  // The channels, or the first error. A text with a contradiction gives no channel at all, because
+  // a part of a file would otherwise be reported as if it were complete.
   [[nodiscard]] static std::variant<std::vector<MetricChannel>, MetricError> from(
       std::string_view text);
 };

@@ -181,8 +181,8 @@ class Parser {
       if (isEnded_) throw Mistake{"expected nothing after # EOF"};
       checkLine(line);
       parseLine(line);
-      // A daemon may be writing the file at this moment. The last number could then be cut to a
-      // smaller one.
+      // A daemon may still be writing the file, and a last number without its last digits would be
+      // a smaller one.
       if (end == std::string_view::npos && !isEnded_) {
         throw Mistake{"the last line has no line break: the file is incomplete"};
       }
@@ -353,7 +353,8 @@ std::optional<MetricNumber> MetricNumber::parse(std::string_view text) {
 std::optional<std::int64_t> MetricNumber::cutDown() const {
   if (whole.has_value()) return whole;
   const double down = std::floor(value);
-  // Written so that a NaN fails. The upper bound is 2^63 itself, which 64 bits cannot hold.
+  // Written so that a NaN fails. The upper bound is 2^63, which a signed integer of 64 bits cannot
+  // hold.
   if (!(down >= -0x1p63 && down < 0x1p63)) return std::nullopt;
   return static_cast<std::int64_t>(down);
 }

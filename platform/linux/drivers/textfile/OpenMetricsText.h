@@ -67,8 +67,9 @@ struct MetricError {
 // which has no "# EOF".
 //
 // Any program may write these files, and their content is not trusted: whatever the format does not
-// allow is an error, and all sizes are bounded. The bounds are far above real files; they keep one
-// file from using up the service's memory or its 50 ms. Pure functions; any thread may call them.
+// allow is an error, and all sizes are bounded. The bounds are far above real files. They keep one
+// file from using up the service's memory or the 50 ms that a reading may take. Pure functions; any
+// thread may call them.
 class OpenMetricsText {
  public:
   static constexpr std::size_t kLargestText = 1U << 20U;

@@ -14,8 +14,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Without IN_MOVED_FROM: each update by renaming causes such an event for another name, and between
-// two sessions these would fill the kernel's queue.
+// IN_MOVED_FROM is not included. Each update by renaming causes such an event for the temporary
+// name. Between two sessions, these events would fill the kernel's queue.
 constexpr std::uint32_t kEvents = IN_DELETE | IN_MOVE_SELF | IN_ONLYDIR;
 
 }  // namespace
@@ -52,7 +52,7 @@ void RemovedFiles::watch() {
   if (!inotify_) inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (inotify_) watched_ = ::inotify_add_watch(inotify_.get(), directory_.c_str(), kEvents);
   if (watched_ != -1) return;
-  // Do not log this: a directory that cannot be opened gives no files either.
+  // Do not log this, because the source finds no files anyway in a directory that cannot be opened.
   const bool isNoDirectory = errno == ENOENT || errno == ENOTDIR || errno == EACCES;
   if (isNoDirectory || std::exchange(isFailureLogged_, true)) return;
   log_.error("cannot watch the directory ", directory_.string(),

@@ -16,8 +16,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Twenty milliseconds: file times advance in steps of up to 10 ms. A file that is read within a
-// step may change again and keep its time.
+// Twenty milliseconds, because file times advance in steps of up to 10 ms. A file that is read
+// within a step may change again without getting another time.
 constexpr std::int64_t kTimeStep = 20'000'000;
 
 constexpr const char* kSkipped = "; skipping the file";
@@ -52,10 +52,10 @@ std::string reasonOf(const FileContent& file) {
 
 std::shared_ptr<const Reading> TextfileSource::read() {
   ++round_;
-  // For all files together: fifty large ones, each within its own bound, took the service to half a
-  // gigabyte.
+  // A limit for all files together: with fifty large files, each within its own limit, the service
+  // used half a gigabyte.
   std::size_t room = kMostBytes;
-  // Do this before listing the files: a deletion after this is noticed at the next reading.
+  // Do this before listing the files. A file that is deleted later is noticed at the next reading.
   forgetRemoved();
   const UniqueFd directory = openDirectory(directory_.c_str());
   for (const std::string& file : directory ? list(directory.get()) : std::vector<std::string>()) {
@@ -113,7 +113,8 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
   if (::fstatat(directory, file.c_str(), &status, 0) != 0) {
     state.error = errno;
   } else {
-    // A file that is too large by itself is skipped anyway and uses up no room.
+    // A file that is larger than one file may be is skipped anyway, and does not count for the
+    // total size.
     const std::size_t size =
         S_ISREG(status.st_mode) && status.st_size <= off_t{OpenMetricsText::kLargestText}
             ? static_cast<std::size_t>(status.st_size)
@@ -126,7 +127,8 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
   if (isSame && entry.isSettled) return;
   if (!isSame) entry.complaint.clear();
   entry.state = state;
-  // Until then, read the file again each time: its time may not show another change.
+  // The file is settled when its last change is older than kTimeStep. Before that, read the file
+  // each time, because its time may not show another change.
   entry.isSettled = state.error != 0 || now() - state.changedAt > kTimeStep;
   if (!state.hasRoom) {
     isChanged_ |= std::exchange(entry.isGood, false);
@@ -143,7 +145,7 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
       {.path = file.c_str(), .most = OpenMetricsText::kLargestText, .directory = directory});
   const std::size_t hash = std::hash<std::string>()(content.bytes);
   const bool isRead = content.isRead();
-  // Most files that are read again have not changed again. Comparing a hash saves parsing them.
+  // Most files that are read again have not changed. Comparing a hash saves parsing them.
   if (isSame && isRead && entry.hash == hash) return;
   entry.hash = isRead ? std::optional(hash) : std::nullopt;
   entry.isGood = false;
@@ -161,7 +163,8 @@ void TextfileSource::readEntry(int directory, const std::string& file, std::size
 
 void TextfileSource::take(std::vector<MetricChannel>&& channels, Entry& entry) {
   std::map<std::string, Channel> known;
-  // Channels that are still in the file keep their objects: differences compare addresses.
+  // Channels that are still in the file keep their objects, because differences identify channels
+  // by address.
   for (const Channel& channel : entry.channels) known.emplace(channel->fullName(), channel);
   entry.channels.clear();
   entry.values.clear();

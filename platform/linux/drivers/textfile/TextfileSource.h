@@ -22,17 +22,17 @@ namespace halvox::platform::linux_ {
 // Reads what other daemons count, from files with metrics in one directory (*.prom).
 //
 // A file that has an error, is too large or is not a regular file is skipped as a whole, and logged
-// once for each change of the file. So are files beyond the total size. If two files have the same
-// channel, the one that sorts first by name is used. A file that is deleted takes its channels with
-// it: a later file of the same name has new channels.
+// once for each change of the file. Files beyond the total size are treated in the same way. If two
+// files have the same channel, the one that sorts first by name is used. A file that is deleted
+// takes its channels with it: a later file of the same name has new channels.
 //
 // A file that has not changed is not read again; its size and times are compared. Its SourceReader
 // owns the source and calls it on one thread.
 class TextfileSource final : public DriverSource {
  public:
   static constexpr std::size_t kMostFiles = 1000;
-  // For all files together, because the content of all of them is kept in memory. Fifty files of 1
-  // MiB took the service to half a gigabyte.
+  // The limit for all files together, because the content of all of them is kept in memory. With
+  // fifty files of 1 MiB, the service used half a gigabyte.
   static constexpr std::size_t kMostBytes = 8U << 20U;
 
   // `log` must outlive the source.

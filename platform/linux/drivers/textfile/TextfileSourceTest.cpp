@@ -74,7 +74,7 @@ TEST_F(TextfileSourceTest, AFileThatIsWrittenInPlaceIsNoticedEvenWithinOneTick) 
 }
 
 TEST_F(TextfileSourceTest, FilesBeyondTheRoomAreSkippedUntilThereIsRoom) {
-  // Each is as large as a file may be. Together they use up the room.
+  // Each is as large as a file may be. Together they reach the total size.
   for (int number = 0; number < 8; ++number) {
     const std::string name = "level" + std::to_string(number);
     std::string text = "# TYPE " + name + " gauge\n" + name + " 5\n";

@@ -18,7 +18,7 @@ import isolation
 TOOLS = ["lttng-sessiond", "lttng", "babeltrace2", "setpriv"]
 MISSING = [tool for tool in TOOLS if shutil.which(tool) is None]
 DEADLINE = 30.0
-# Whatever ends a test also ends what it started.
+# However a test ends, the kernel also ends the programs that it started.
 WITH_US = ["setpriv", "--pdeathsig", "KILL", "--"]
 
 
