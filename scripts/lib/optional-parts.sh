@@ -14,6 +14,7 @@ declare -A options=(
   [trace-points]="-DHALVOX_WITH_LTTNG=OFF"
   [tracing]="-DHALVOX_TRACING=OFF"
   [nats]="-DHALVOX_NATS=OFF"
+  [report]="-DHALVOX_REPORT=OFF"
 )
 options[all]="${options[*]}"
 
@@ -41,7 +42,7 @@ case "${1:-}" in
     check all halvox-reportingd
     ;;
   "")
-    for part in alsa pipewire trace-points tracing nats all; do
+    for part in alsa pipewire trace-points tracing nats report all; do
       check "$part" all
       test_units "$part"
     done

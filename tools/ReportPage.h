@@ -1,0 +1,13 @@
+#pragma once
+
+#include <string_view>
+
+namespace halvox::tools {
+
+// The page that `halvoxctl report` writes, without its data: HTML up to where the JSON of the
+// report stands, and from there on. Both are empty in a build without HALVOX_REPORT. Made at build
+// time from tools/report.
+std::string_view reportPageBeforeData();
+std::string_view reportPageAfterData();
+
+}  // namespace halvox::tools

@@ -1,0 +1,110 @@
+// Builds elements. All texts become text nodes: nothing from a client is ever parsed as HTML.
+
+export function element(name, attributes = {}, ...children) {
+  const made = document.createElement(name);
+  for (const [key, value] of Object.entries(attributes)) {
+    if (value === undefined || value === null || value === false) continue;
+    if (key.startsWith("on")) made.addEventListener(key.slice(2), value);
+    else made.setAttribute(key, value === true ? "" : value);
+  }
+  made.append(...children.flat().filter((child) => child !== null && child !== undefined));
+  return made;
+}
+
+// A section with a heading that links and assistive technology can find.
+export function section(id, heading, ...children) {
+  return element(
+    "section",
+    { id, "aria-labelledby": `${id}-heading` },
+    element("h2", { id: `${id}-heading` }, heading),
+    ...children,
+  );
+}
+
+const ROWS_AT_ONCE = 200;
+
+// A table with the numbers of a picture. `columns` are [heading, how a row shows in it, options]; a
+// column with {number: true} is aligned to the right. Long tables begin with the first rows.
+export function table(caption, columns, rows) {
+  const body = element("tbody");
+  const add = (from, to) => {
+    for (const row of rows.slice(from, to)) {
+      const cells = columns.map(([, show, options = {}], index) => {
+        const kind = index === 0 ? "th" : "td";
+        const cell = element(kind, {
+          scope: index === 0 ? "row" : undefined,
+          class: options.number ? "number" : options.long ? "long" : undefined,
+        });
+        cell.append(show(row) ?? "");
+        return cell;
+      });
+      body.append(element("tr", {}, cells));
+    }
+  };
+  add(0, ROWS_AT_ONCE);
+  const made = element(
+    "table",
+    {},
+    element("caption", {}, caption),
+    element(
+      "thead",
+      {},
+      element(
+        "tr",
+        {},
+        columns.map(([heading, , options = {}]) =>
+          element("th", { scope: "col", class: options.number ? "number" : undefined }, heading),
+        ),
+      ),
+    ),
+    body,
+  );
+  // A region that scrolls must be reachable with the keyboard.
+  const box = element("div", { class: "scroll", tabindex: 0, role: "region", "aria-label": caption }, made);
+  if (rows.length <= ROWS_AT_ONCE) return box;
+  const more = element(
+    "button",
+    {
+      type: "button",
+      onclick: () => {
+        add(ROWS_AT_ONCE, rows.length);
+        more.remove();
+      },
+    },
+    `Show all ${rows.length} rows`,
+  );
+  return element("div", {}, box, more);
+}
+
+// A table that opens below its picture. It is made when it is first opened or printed.
+export function numbers(title, makeTable, { open = false } = {}) {
+  const details = element("details", { class: "numbers" }, element("summary", {}, title));
+  let made = false;
+  const fill = () => {
+    if (!details.open || made) return;
+    made = true;
+    details.append(makeTable());
+  };
+  details.addEventListener("toggle", fill);
+  details.open = open;
+  fill();
+  window.addEventListener("beforeprint", () => {
+    details.open = true;
+    fill();
+  });
+  return details;
+}
+
+// A picture that is drawn again when its width changes.
+export function picture(label, draw, { role = "img" } = {}) {
+  const frame = element("div", { class: "frame", role, "aria-label": label });
+  let width = 0;
+  const redraw = () => {
+    const now = Math.floor(frame.clientWidth);
+    if (now === width || now === 0) return;
+    width = now;
+    frame.replaceChildren(draw(width));
+  };
+  new ResizeObserver(redraw).observe(frame);
+  return frame;
+}
