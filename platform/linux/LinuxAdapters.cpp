@@ -65,15 +65,11 @@ TraceOptions traceOptions(const Configuration& configuration, FeatureFlagService
           .tracing = isEnabled ? Tracing::kEnabled : Tracing::kDisabled};
 }
 
-// Null if link.backend is not "nats" or if its module cannot be loaded.
-std::unique_ptr<NatsTlmReporting> makeNats(const Configuration::Link& options,
-                                           const NatsEnvironment& environment,
-                                           std::string& failure) {
+// Null if link.backend is not "nats", an error if its module cannot be loaded.
+Result<std::unique_ptr<NatsTlmReporting>> makeNats(const Configuration::Link& options,
+                                                   const NatsEnvironment& environment) {
   if (options.backend != LinkBackend::kNats) return nullptr;
-  auto loaded = loadNatsTlmReporting(options, environment);
-  if (loaded) return *std::move(loaded);
-  failure = std::move(loaded).error().message;
-  return nullptr;
+  return loadNatsTlmReporting(options, environment);
 }
 
 }  // namespace
@@ -121,10 +117,10 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
       resultsFiles(configuration.storage.root, *log, statistics),
       traces(makeTraceServices(traceOptions(configuration, featureFlags), *log, statistics)),
       dispatch(*log, statistics),
-      nats(makeNats(configuration.link, {dispatch, statistics}, natsFailure)) {}
+      nats(makeNats(configuration.link, {dispatch, statistics})) {}
 
 TLMReportingService& LinuxAdapters::realTimeLink() {
-  if (nats) return *nats;
+  if (nats && *nats) return **nats;
   if (configuration.link.backend == LinkBackend::kNone) return noLink;
   return localLink;
 }

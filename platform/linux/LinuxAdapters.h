@@ -5,6 +5,7 @@
 #include <string>
 
 #include "platform/linux/SqliteSnapshotRecorder.h"
+#include "platform/linux/base/Result.h"
 #include "platform/linux/configuration/Configuration.h"
 #include "platform/linux/configuration/ConfiguredDevicePropertyService.h"
 #include "platform/linux/configuration/ConfiguredFeatureFlagService.h"
@@ -88,8 +89,8 @@ struct LinuxAdapters {
   JsonResultsFileService resultsFiles;
   const std::unique_ptr<TraceServices> traces;
   AsioDispatchService dispatch;
-  std::string natsFailure;  // why link.backend = "nats" is impossible, or empty
-  const std::unique_ptr<NatsTlmReporting> nats;  // null unless link.backend is "nats"
+  // Null unless link.backend is "nats"; then an error if its module cannot be loaded.
+  const Result<std::unique_ptr<NatsTlmReporting>> nats;
 };
 
 }  // namespace halvox::platform::linux_

@@ -93,8 +93,8 @@ Services LinuxPlatform::services() {
 }
 
 Result<void, int> LinuxPlatform::open() {
-  if (!adapters_->natsFailure.empty()) {
-    return Failure<int>{EX_CONFIG, "link.backend = \"nats\" needs " + adapters_->natsFailure};
+  if (const auto& nats = adapters_->nats; !nats) {
+    return Failure<int>{EX_CONFIG, "link.backend = \"nats\" needs " + nats.error().message};
   }
   // Open the store before the sockets, so that everything that is accepted can be stored.
   if (const auto opened = adapters_->store.open(); !opened) return startFailure(opened.error());
@@ -124,7 +124,8 @@ bool LinuxPlatform::close() {
   ended ? adapters_->traces->close() : adapters_->traces->abandon();
   // Stop the callbacks after the queues: then no session can request a callback.
   adapters_->linkCallbacks.stop();
-  const bool linkEnded = !adapters_->nats || adapters_->nats->close();
+  const auto& nats = adapters_->nats;
+  const bool linkEnded = !nats || !*nats || (*nats)->close();
   // Close the store after the link: the local link writes to it until its last message.
   adapters_->store.close();
   // Log the counters after everything that counts has ended: their sums agree only then.
