@@ -39,7 +39,7 @@ test_units() {
 
 case "${1:-}" in
   --quick)
-    check all halvox-reportingd
+    check all halvox-reportingd halvox-sqlite halvoxctl
     ;;
   "")
     for part in alsa pipewire trace-points tracing nats report all; do
