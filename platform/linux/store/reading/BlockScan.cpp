@@ -47,6 +47,7 @@ SqliteCode BlockScan::begin() {
 
 std::vector<BlockScan::Alternatives> BlockScan::wantedKeys() const {
   std::vector<Alternatives> wanted;
+  if (!kind_.has_value()) return wanted;
   const auto isPattern = [](const std::string& name) {
     return name.find_first_of("*?[\\") != std::string::npos;
   };
@@ -174,13 +175,16 @@ bool BlockScan::nextRecord() {
   while (reader_.next()) {
     const StoredRecordID number = id();
     if (number < next_ || number > last_) continue;
-    if (reader_.record().kind == kind_ && passes(reader_.record())) return true;
+    const BlockRecordKind kind = reader_.record().kind;
+    const bool isWanted = kind_.has_value() ? kind == *kind_ : kind != BlockRecordKind::kGap;
+    if (isWanted && passes(reader_.record())) return true;
   }
   return false;
 }
 
 bool BlockScan::passes(const BlockRecord& record) {
   if (!isWithinTimes(filter_, record.time)) return false;
+  if (!kind_.has_value()) return true;
   if (kind_ == BlockRecordKind::kEvent) return hasName(record.name);
   for (const NumberMatch& match : filter_.numbers) {
     const std::int64_t number = match.column == kLinkSessionID  ? record.sessionID

@@ -16,9 +16,9 @@
 
 namespace halvox::platform::linux_ {
 
-// One pass over the events or the link messages in blocks that pass a filter. Copies one block at a
-// time and holds no snapshot while its records are used: see StoreReader. Meanwhile the store may
-// join blocks. Numbers do not change: the pass meets each record once. The pass ends with
+// One pass over the events, the link messages or both in blocks that pass a filter. Copies one
+// block at a time and holds no snapshot while its records are used: see StoreReader. Meanwhile the
+// store may join blocks. Numbers do not change: the pass meets each record once. The pass ends with
 // the last record that was stored when it began. Belongs to the thread of its database and does not
 // own its arguments. After an error the scan is over.
 //
@@ -26,7 +26,9 @@ namespace halvox::platform::linux_ {
 //   nothing is found
 class BlockScan {
  public:
-  BlockScan(Database& database, BlockRecordKind kind, const RecordFilter& filter)
+  // Reads both kinds, in the order of storing, if `kind` is empty. Of the filter only the times and
+  // `after` count then.
+  BlockScan(Database& database, std::optional<BlockRecordKind> kind, const RecordFilter& filter)
       : database_(database), kind_(kind), filter_(filter) {}
 
   // Finds the first and the last record to read. Call once.
@@ -69,7 +71,7 @@ class BlockScan {
   [[nodiscard]] bool hasName(std::string_view name);
 
   Database& database_;
-  const BlockRecordKind kind_;
+  const std::optional<BlockRecordKind> kind_;
   const RecordFilter& filter_;
   // The numbers to read: those from next_ to last_ that are in ranges_. The ranges are in ascending
   // order; those before range_ are read.

@@ -52,6 +52,31 @@ struct StoredRecord {
   }
 };
 
+// A stored record of any kind, read without a copy. Its views are valid during the callback only. A
+// member that the kind does not have is empty or 0.
+struct StoredItem {
+  const RecordTable* table = nullptr;  // null: an event
+  StoredRecordID id = 0;
+  double time = 0;               // seconds since 1970
+  std::string_view name;         // of an event or a power event
+  std::string_view application;  // of an event in a block; empty if the payload does not name it
+  std::int64_t sessionID = 0;    // of a link message, with the next two
+  std::string_view clientName;
+  std::string_view serviceName;
+  std::int64_t number = 0;   // a link message's or a power event's category, a metric's ID
+  std::int64_t type = 0;     // of a link message
+  std::string_view payload;  // JSON text; a metric's bytes; a snapshot's signature
+  std::string_view path;     // of a snapshot
+};
+
+// Which kinds forEachItem() reads. Events and link messages are read together.
+struct StoredKinds {
+  bool messages = true;
+  bool metrics = false;
+  bool power = false;
+  bool snapshots = false;
+};
+
 // Which records to read. A member that is not set selects everything.
 struct RecordFilter {
   // Patterns for fnmatch(3). The name must match at least one; kinds without a name ignore them.
@@ -75,6 +100,7 @@ class StoreReader {
  public:
   using EventCallback = std::function<void(const StoredEvent&)>;
   using RecordCallback = std::function<void(const StoredRecord&)>;
+  using ItemCallback = std::function<void(const StoredItem&)>;
 
   // Opens the store in `directory`, and closes the one that was open. Fails with kMissing when
   // there is none or nothing was stored yet, kDamaged, kNewerVersion or kCannotOpen.
@@ -88,6 +114,13 @@ class StoreReader {
   // kind has no such records, which is not an error.
   Result<void, StoreError> forEachRecord(const RecordTable& table, const RecordFilter& filter,
                                          const RecordCallback& callback);
+
+  // Calls `callback` on this thread for each record of several kinds within a range of time. Events
+  // and link messages come in the order of storing; the other kinds are merged with them by time.
+  // Of the filter only the times count. lastRead() does not change. Memory does not grow with the
+  // store.
+  Result<void, StoreError> forEachItem(const StoredKinds& kinds, const RecordFilter& filter,
+                                       const ItemCallback& callback);
 
   // The last record that the last complete reading looked at, whether the filter let it through or
   // not. A reading that continues after it misses no record.

@@ -1,0 +1,223 @@
+#include <algorithm>
+#include <memory>
+#include <utility>
+#include <vector>
+
+#include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/reading/BlockScan.h"
+#include "platform/linux/store/reading/EventScan.h"
+#include "platform/linux/store/reading/RecordScan.h"
+#include "platform/linux/store/reading/StoreReader.h"
+
+// How records of several kinds are read in one pass.
+namespace halvox::platform::linux_ {
+namespace {
+
+// One ordered sequence of records. begin(), then advance() until isAtEnd(). After an error the
+// cursor is over.
+class ItemCursor {
+ public:
+  ItemCursor() = default;
+  ItemCursor(const ItemCursor&) = delete;
+  ItemCursor& operator=(const ItemCursor&) = delete;
+  virtual ~ItemCursor() = default;
+
+  [[nodiscard]] virtual SqliteCode begin() = 0;
+  // Moves to the next record; the views of the one before are no longer valid.
+  [[nodiscard]] virtual SqliteCode advance() = 0;
+  [[nodiscard]] const StoredItem& item() const { return item_; }
+  [[nodiscard]] bool isAtEnd() const { return isAtEnd_; }
+
+ protected:
+  StoredItem item_{};
+  bool isAtEnd_ = false;
+};
+
+// The events and the link messages in blocks.
+class BlockCursor final : public ItemCursor {
+ public:
+  BlockCursor(Database& database, const RecordFilter& filter)
+      : scan_(database, std::nullopt, filter) {}
+
+  SqliteCode begin() override { return scan_.begin(); }
+  SqliteCode advance() override {
+    while (!found_ || !scan_.nextRecord()) {
+      if (scan_.isDamaged()) return SQLITE_CORRUPT;
+      const SqliteCode code = scan_.nextBlock(found_);
+      if (code != SQLITE_OK) return code;
+      if (!found_) {
+        isAtEnd_ = true;
+        return SQLITE_OK;
+      }
+    }
+    const BlockRecord& record = scan_.record();
+    const bool isLink = record.kind == BlockRecordKind::kLink;
+    item_ = {.table = isLink ? &kLinkMessages : nullptr,
+             .id = scan_.id(),
+             .time = record.time,
+             .name = record.name,
+             .application = record.application,
+             .sessionID = record.sessionID,
+             .clientName = record.clientName,
+             .serviceName = record.serviceName,
+             .number = record.category,
+             .type = record.type,
+             .payload = record.payload,
+             .path = {}};
+    return SQLITE_OK;
+  }
+
+ private:
+  BlockScan scan_;
+  bool found_ = false;
+};
+
+// Events of earlier versions, which are not in blocks.
+class EventCursor final : public ItemCursor {
+ public:
+  EventCursor(Database& database, const RecordFilter& filter) : scan_(database, filter) {}
+
+  SqliteCode begin() override { return scan_.begin(); }
+  SqliteCode advance() override {
+    while (next_ == piece_.events.size()) {
+      if (scan_.isAtEnd()) {
+        isAtEnd_ = true;
+        return SQLITE_OK;
+      }
+      const SqliteCode code = scan_.next(piece_);
+      if (code != SQLITE_OK) return code;
+      next_ = 0;
+    }
+    const EventScan::Event& event = piece_.events[next_++];
+    item_ = {};
+    item_.id = event.id;
+    item_.time = event.time;
+    item_.name = scan_.nameOf(event.nameID);
+    item_.payload = piece_.payloads[event.payload];
+    return SQLITE_OK;
+  }
+
+ private:
+  EventScan scan_;
+  EventScan::Piece piece_;
+  std::size_t next_ = 0;
+};
+
+// The records of one kind that are stored one to a row.
+class RowCursor final : public ItemCursor {
+ public:
+  RowCursor(Database& database, const RecordTable& table, const RecordFilter& filter)
+      : table_(table), scan_(database, table, filter) {}
+
+  SqliteCode begin() override { return scan_.begin(); }
+  SqliteCode advance() override {
+    while (next_ == piece_.size()) {
+      if (scan_.isAtEnd()) {
+        isAtEnd_ = true;
+        return SQLITE_OK;
+      }
+      const SqliteCode code = scan_.next(piece_);
+      if (code != SQLITE_OK) return code;
+      next_ = 0;
+    }
+    show(piece_[next_++]);
+    return SQLITE_OK;
+  }
+
+ private:
+  void show(const StoredRecord& record) {
+    item_ = {};
+    item_.table = &table_;
+    item_.id = record.id;
+    item_.time = record.time;
+    if (&table_ == &kLinkMessages) {
+      item_.sessionID = record.number(kLinkSessionID);
+      item_.clientName = record.text(kLinkClientName);
+      item_.serviceName = record.text(kLinkServiceName);
+      item_.number = record.number(kLinkCategory);
+      item_.type = record.number(kLinkType);
+      item_.payload = record.text(kLinkPayload);
+    } else if (&table_ == &kPowerEvents) {
+      item_.number = record.number(kPowerCategory);
+      item_.name = record.text(kPowerEventName);
+      item_.payload = record.text(kPowerPayload);
+    } else if (&table_ == &kIssueMetrics) {
+      item_.number = record.number(kMetricID);
+      item_.payload = record.text(kMetricMessage);
+    } else {
+      item_.payload = record.text(kSnapshotSignature);
+      item_.path = record.text(kSnapshotPath);
+    }
+  }
+
+  const RecordTable& table_;
+  RecordScan scan_;
+  std::vector<StoredRecord> piece_;
+  std::size_t next_ = 0;
+};
+
+using Cursors = std::vector<std::unique_ptr<ItemCursor>>;
+
+Cursors cursorsFor(Database& database, std::int64_t version, const StoredKinds& kinds,
+                   const RecordFilter& filter) {
+  Cursors cursors;
+  // A store from an older service lacks the table and has no such records.
+  const auto addRows = [&](bool wanted, const RecordTable& table) {
+    if (!wanted || version < table.sinceVersion) return;
+    cursors.push_back(std::make_unique<RowCursor>(database, table, filter));
+  };
+  if (kinds.messages) cursors.push_back(std::make_unique<EventCursor>(database, filter));
+  addRows(kinds.messages, kLinkMessages);
+  if (kinds.messages && version >= kBlocksSinceVersion) {
+    cursors.push_back(std::make_unique<BlockCursor>(database, filter));
+  }
+  addRows(kinds.metrics, kIssueMetrics);
+  addRows(kinds.power, kPowerEvents);
+  addRows(kinds.snapshots, kSnapshots);
+  return cursors;
+}
+
+// The cursor whose record is the oldest; nullptr if all are at their end. There are at most six: a
+// heap would cost more than it saves.
+ItemCursor* oldestOf(const Cursors& cursors) {
+  ItemCursor* oldest = nullptr;
+  for (const auto& cursor : cursors) {
+    if (cursor->isAtEnd()) continue;
+    if (oldest == nullptr || cursor->item().time < oldest->item().time) oldest = cursor.get();
+  }
+  return oldest;
+}
+
+}  // namespace
+
+Result<void, StoreError> StoreReader::forEachItem(const StoredKinds& kinds,
+                                                  const RecordFilter& filter,
+                                                  const ItemCallback& callback) {
+  if (!database_.isOpen()) return Failure<StoreError>{StoreError::kMissing, "no store is open"};
+  // Read the version for each call: a service may have migrated the store since it was opened.
+  const auto version = database_.queryInteger("PRAGMA user_version");
+  if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
+  RecordFilter times;
+  times.since = filter.since;
+  times.until = filter.until;
+  const Cursors cursors = cursorsFor(database_, *version, kinds, times);
+  const auto failed = [&](const ItemCursor& cursor, SqliteCode code) {
+    // SQLite knows nothing of damage inside a block.
+    return code == SQLITE_CORRUPT && sqlite3_errcode(database_.get()) != SQLITE_CORRUPT
+               ? damagedBlock(cursor.item().id)
+               : failure(code);
+  };
+  for (const auto& cursor : cursors) {
+    SqliteCode code = cursor->begin();
+    if (code == SQLITE_OK) code = cursor->advance();
+    if (code != SQLITE_OK) return failed(*cursor, code);
+  }
+  while (ItemCursor* const cursor = oldestOf(cursors)) {
+    callback(cursor->item());
+    const SqliteCode code = cursor->advance();
+    if (code != SQLITE_OK) return failed(*cursor, code);
+  }
+  return {};
+}
+
+}  // namespace halvox::platform::linux_
