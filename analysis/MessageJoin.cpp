@@ -1,0 +1,163 @@
+#include "analysis/MessageJoin.h"
+
+#include <bit>
+#include <utility>
+
+#include "analysis/MessageNames.h"
+
+namespace halvox::analysis {
+namespace {
+
+constexpr std::string_view kStampKey = "hvreporting_timestamp";
+
+// The stamp has fractions of a microsecond: two messages of one category and type have the same
+// only if a client sent one message to several sessions.
+std::uint64_t keyOf(const Record& record) {
+  const auto stamp = record.payload->number(kStampKey);
+  if (!stamp || record.category.empty()) return 0;
+  const std::hash<std::string_view> hash;
+  std::uint64_t key = std::bit_cast<std::uint64_t>(*stamp);
+  for (const std::string_view text : {record.category, record.type}) {
+    key = (key ^ hash(text)) * 0x9E3779B97F4A7C15U;
+  }
+  return key | 1U;
+}
+
+bool isSame(std::string_view text, std::string_view other) {
+  return text.empty() || other.empty() || text == other;
+}
+
+}  // namespace
+
+void MessageJoin::add(const Record& record) {
+  if (record.kind == RecordKind::kEvent) {
+    addEvent(record);
+  } else if (record.kind == RecordKind::kLinkMessage) {
+    addLinkMessage(record);
+  } else {
+    return;
+  }
+  deliverReady(record.time);
+}
+
+void MessageJoin::addEvent(const Record& record) {
+  if (record.category.empty()) {
+    // Not a message. It keeps its place among them.
+    Waiting& event = push(record, 0);
+    event.message.name = record.name;
+    event.isComplete = true;
+    return;
+  }
+  if (completesTwin(record)) return;
+  const bool isCommon = record.service == kCommonService;
+  const std::uint64_t key = keyOf(record);
+  Waiting* message = find(key, record);
+  if (message == nullptr) message = &push(record, key);
+  message->message.isEvent = true;
+  // The link's payload has another key; the twin is recognised by the event's.
+  if (message->message.isLinkMessage) message->message.payload = record.payload->json();
+  message->message.application = record.application;
+  message->hasCommon = isCommon;
+  if (!isCommon) message->message.service = record.service;
+}
+
+// The second event of a message follows the first without another event between them.
+bool MessageJoin::completesTwin(const Record& record) {
+  if (record.service == kCommonService || !lastEvent_) return false;
+  Waiting* const last = waiting(*std::exchange(lastEvent_, std::nullopt));
+  if (last == nullptr || !last->hasCommon || last->message.type != record.type ||
+      last->message.category != record.category ||
+      last->message.payload != record.payload->json()) {
+    return false;
+  }
+  last->message.service = record.service;
+  last->isComplete = last->message.isLinkMessage || last->key == 0;
+  return true;
+}
+
+void MessageJoin::addLinkMessage(const Record& record) {
+  const std::uint64_t key = keyOf(record);
+  Waiting* message = find(key, record);
+  if (message == nullptr) {
+    message = &push(record, key);
+    // Without a stamp nothing finds it.
+    message->isComplete = key == 0;
+  } else {
+    message->isComplete = !message->message.service.empty();
+  }
+  message->message.isLinkMessage = true;
+  message->message.sessionID = record.sessionID;
+  if (message->message.service.empty()) message->message.service = record.service;
+}
+
+MessageJoin::Waiting* MessageJoin::find(std::uint64_t key, const Record& record) {
+  if (key == 0) return nullptr;
+  const bool isEvent = record.kind == RecordKind::kEvent;
+  Waiting* found = nullptr;
+  std::uint64_t foundNumber = 0;
+  const auto [begin, end] = byKey_.equal_range(key);
+  for (auto place = begin; place != end; ++place) {
+    Waiting* const candidate = waiting(place->second);
+    if (candidate == nullptr) continue;
+    const Message& message = candidate->message;
+    if (isEvent ? message.isEvent : message.isLinkMessage) continue;
+    if (message.category != record.category || message.type != record.type) continue;
+    const std::string_view service =
+        record.service == kCommonService ? std::string_view() : record.service;
+    if (!isSame(message.service, service)) continue;
+    // The oldest: a message to several sessions reaches them in one order.
+    if (found != nullptr && place->second > foundNumber) continue;
+    found = candidate;
+    foundNumber = place->second;
+  }
+  if (found != nullptr && isEvent) lastEvent_ = foundNumber;
+  return found;
+}
+
+MessageJoin::Waiting& MessageJoin::push(const Record& record, std::uint64_t key) {
+  if (waiting_.size() == kMostWaiting) deliverFirst();
+  const std::uint64_t number = firstNumber_ + waiting_.size();
+  Waiting& added = waiting_.emplace_back();
+  added.key = key;
+  added.message.id = record.id;
+  added.message.time = record.time;
+  added.message.category = record.category;
+  added.message.type = record.type;
+  added.message.payload = record.payload->json();
+  if (key != 0) byKey_.emplace(key, number);
+  if (record.kind == RecordKind::kEvent && !record.category.empty()) lastEvent_ = number;
+  return added;
+}
+
+MessageJoin::Waiting* MessageJoin::waiting(std::uint64_t number) {
+  if (number < firstNumber_ || number - firstNumber_ >= waiting_.size()) return nullptr;
+  return &waiting_[number - firstNumber_];
+}
+
+void MessageJoin::deliverReady(double now) {
+  while (!waiting_.empty()) {
+    const Waiting& first = waiting_.front();
+    if (!first.isComplete && now - first.message.time <= kLongestWait) return;
+    deliverFirst();
+  }
+}
+
+void MessageJoin::deliverFirst() {
+  // Taken out first: the callback may take long, but it must not see a half-delivered queue.
+  Waiting first = std::move(waiting_.front());
+  waiting_.pop_front();
+  const std::uint64_t number = firstNumber_++;
+  const auto [begin, end] = byKey_.equal_range(first.key);
+  for (auto place = begin; place != end; ++place) {
+    if (place->second != number) continue;
+    byKey_.erase(place);
+    break;
+  }
+  callback_(first.message);
+}
+
+void MessageJoin::finish() {
+  while (!waiting_.empty()) deliverFirst();
+}
+
+}  // namespace halvox::analysis

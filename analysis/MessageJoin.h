@@ -1,0 +1,78 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <deque>
+#include <functional>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+
+#include "analysis/RecordSource.h"
+
+namespace halvox::analysis {
+
+// One message of a client, or of the service itself, with all that its records say.
+struct Message {
+  std::int64_t id = 0;      // of its first record
+  double time = 0;          // when it was recorded, in seconds since 1970
+  std::string name;         // of an event that is not a message, such as the end of a client
+  std::string service;      // empty if unknown
+  std::string category;     // with its domain: "Session_Playback"
+  std::string type;         // "Start"
+  std::string application;  // empty if unknown
+  std::optional<std::int64_t> sessionID;  // -1 outside a session
+  std::string payload;                    // JSON
+  bool isEvent = false;                   // it was recorded as an event
+  bool isLinkMessage = false;             // it went through the link
+};
+
+// Makes one message of its records: up to two events, whose names differ and whose payloads are
+// equal, and one link message for each session, which has another key in its payload. The stamp
+// that the service puts into each message brings event and link message together.
+//
+// The link records later than the events, and some messages never: those that repeat the one
+// before, and those of a service without a link in the store. A message therefore waits for its
+// other record until kLongestWait seconds of records, or kMostWaiting messages, have passed.
+// Messages come out in the order of their first records. Memory is bounded. Belongs to one thread.
+class MessageJoin {
+ public:
+  static constexpr double kLongestWait = 10;
+  static constexpr std::size_t kMostWaiting = 4096;
+
+  using Callback = std::function<void(const Message&)>;
+  // Calls `callback` from add() and finish().
+  explicit MessageJoin(Callback callback) : callback_(std::move(callback)) {}
+
+  // Takes the next event or link message; ignores other kinds.
+  void add(const Record& record);
+  // Delivers the messages that still wait. Call once, after the last record.
+  void finish();
+
+ private:
+  struct Waiting {
+    Message message;
+    std::uint64_t key = 0;    // of stamp, category and type; 0 without a stamp
+    bool hasCommon = false;   // its event under the name that all services share
+    bool isComplete = false;  // nothing more can come
+  };
+
+  void addEvent(const Record& record);
+  void addLinkMessage(const Record& record);
+  [[nodiscard]] bool completesTwin(const Record& record);
+  // Finds a message that waits for a record of the other kind.
+  [[nodiscard]] Waiting* find(std::uint64_t key, const Record& record);
+  Waiting& push(const Record& record, std::uint64_t key);
+  void deliverReady(double now);
+  void deliverFirst();
+  [[nodiscard]] Waiting* waiting(std::uint64_t number);
+
+  Callback callback_;
+  std::deque<Waiting> waiting_;
+  std::uint64_t firstNumber_ = 0;                                // of waiting_.front()
+  std::unordered_multimap<std::uint64_t, std::uint64_t> byKey_;  // key to number
+  std::optional<std::uint64_t> lastEvent_;  // the number of the last event's message
+};
+
+}  // namespace halvox::analysis

@@ -1,0 +1,247 @@
+#include "analysis/StreamBuilder.h"
+
+#include <algorithm>
+#include <cmath>
+#include <utility>
+#include <vector>
+
+#include "analysis/OpenStream.h"
+
+namespace halvox::analysis {
+namespace {
+
+constexpr std::string_view kClientGoneEvent = "com.tarno.halvox.hvreportingclientuptime";
+constexpr std::string_view kSummaryKey = "HV_Session_Summary_Event";
+constexpr std::string_view kSerialKey = "object_serial";
+// The kernel keeps the first 15 bytes of a program's name.
+constexpr std::string_view kReporterProcess = "halvox-pipewire";
+constexpr std::string_view kStandalone = "standalone";
+constexpr std::int64_t kNoSession = -1;
+// The records of a lost connection and of the ends of its sessions are written by different
+// threads.
+constexpr double kSameMoment = 1;
+
+bool isSummary(const Message& message, const Payload& payload) {
+  return message.isLinkMessage && !message.isEvent && message.type == "Unknown" &&
+         payload.text(kSummaryKey).has_value();
+}
+
+// What the service itself sends at the end of a session. It does not begin a story.
+bool isEndReport(const Message& message) {
+  return message.category == "IOReporting" || message.type == "Summary" ||
+         message.type == "Unknown";
+}
+
+std::uint64_t programOf(std::string_view application, std::string_view service) {
+  const std::hash<std::string_view> hash;
+  return hash(application.substr(0, kLongestStoryText)) * 0x9E3779B97F4A7C15U ^ hash(service);
+}
+
+}  // namespace
+
+StreamBuilder::StreamBuilder(StoryCallback onStory, MomentCallback onMoment)
+    : onStory_(std::move(onStory)),
+      onMoment_(std::move(onMoment)),
+      join_([this](const Message& message) { onMessage(message); }) {}
+
+StreamBuilder::~StreamBuilder() = default;
+
+void StreamBuilder::onMessage(const Message& message) {
+  const double before = std::exchange(lastTime_, message.time);
+  payload_.show(message.payload);
+  settleUndecided(message.time);
+  if (message.category.empty()) {
+    if (message.name == kClientGoneEvent) onClientGone(message);
+    return;
+  }
+  noticeRestart(message, before);
+  OpenStream* const stream = streamOf(message);
+  if (stream == nullptr) return;
+  if (message.sessionID && !stream->story().sessionID) {
+    stream->setSessionID(*message.sessionID);
+    bySession_.insert_or_assign(*message.sessionID, stream);
+  }
+  if (isSummary(message, payload_)) {
+    endSession(*stream, message);
+    return;
+  }
+  streams_.splice(streams_.end(), streams_, stream->place);
+  stream->add(message, payload_);
+  noteProgram(*stream, message);
+}
+
+// The two uptimes of a message are of one clock: their difference is the same for all messages of
+// one process, but for rounding to a second.
+void StreamBuilder::noticeRestart(const Message& message, double before) {
+  constexpr double kRounding = 2;
+  constexpr double kDisorder = 0.1;
+  const auto system = payload_.number("systemuptime_sec");
+  const auto process = payload_.number("processuptime_ms");
+  if (!system || !process || !message.isEvent) return;
+  const double uptime = *process / 1000;
+  const double start = *system - uptime;
+  if (serviceStart_ &&
+      (std::abs(start - *serviceStart_) > kRounding || uptime < serviceUptime_ - kDisorder)) {
+    // The store does not say when the service ended. It was still running at the record before.
+    closeAll(StreamEnd::kServiceGone, before);
+    serviceStart_.reset();
+  }
+  if (!serviceStart_) serviceStart_ = start;
+  serviceUptime_ = uptime;
+}
+
+OpenStream* StreamBuilder::streamOf(const Message& message) {
+  if (message.sessionID == kNoSession) return nullptr;
+  if (const auto serial = payload_.integer(kSerialKey)) {
+    if (OpenStream* const found = findBySerial(*serial, message)) return found;
+    OpenStream& opened = open(message);
+    opened.setSerial(*serial);
+    bySerial_.emplace(*serial, &opened);
+    return &opened;
+  }
+  if (message.sessionID) {
+    const auto found = bySession_.find(*message.sessionID);
+    if (found == bySession_.end()) {
+      return isSummary(message, payload_) ? nullptr : &open(message);
+    }
+    if (!found->second->undecidedSince) return found->second;
+    // The session was started again.
+    close(*found->second, StreamEnd::kStopped, *found->second->undecidedSince);
+    return &open(message);
+  }
+  if (message.service == kStandalone) return nullptr;
+  if (OpenStream* const found = findByProgram(message)) return found;
+  return isEndReport(message) ? nullptr : &open(message);
+}
+
+OpenStream* StreamBuilder::findBySerial(std::int64_t serial, const Message& message) {
+  const auto [begin, end] = bySerial_.equal_range(serial);
+  for (auto place = begin; place != end; ++place) {
+    OpenStream& stream = *place->second;
+    const StreamStory& story = stream.story();
+    if (message.sessionID && story.sessionID && message.sessionID != story.sessionID) continue;
+    if (!message.application.empty() && !story.application.empty() &&
+        !std::string_view(message.application).starts_with(story.application)) {
+      continue;
+    }
+    // A session that has ended takes nothing more. A first run after another one is of a stream
+    // that got the serial after a restart of PipeWire.
+    const bool isFirstRun = message.type == "Start" && payload_.integer("run") == 1;
+    if (stream.undecidedSince || (isFirstRun && stream.hasStarted())) {
+      close(stream, StreamEnd::kStopped, 0);
+      return nullptr;
+    }
+    return &stream;
+  }
+  return nullptr;
+}
+
+OpenStream* StreamBuilder::findByProgram(const Message& message) const {
+  const auto found = byProgram_.find(programOf(message.application, message.service));
+  if (found == byProgram_.end() || found->second->undecidedSince) return nullptr;
+  return found->second;
+}
+
+OpenStream& StreamBuilder::open(const Message& message) {
+  if (streams_.size() == kMostOpen) close(*streams_.front(), StreamEnd::kStillRunning, 0);
+  streams_.push_back(std::make_unique<OpenStream>(message, onMoment_));
+  streams_.back()->place = std::prev(streams_.end());
+  return *streams_.back();
+}
+
+void StreamBuilder::endSession(OpenStream& stream, const Message& message) {
+  if (!stream.runs()) {
+    close(stream, StreamEnd::kStopped, message.time);
+  } else if (lastClientGone_ && message.time - *lastClientGone_ <= kSameMoment) {
+    close(stream, StreamEnd::kClientGone, message.time);
+  } else {
+    stream.undecidedSince = message.time;
+    undecided_.push_back(&stream);
+  }
+}
+
+void StreamBuilder::onClientGone(const Message& message) {
+  lastClientGone_ = message.time;
+  const bool isReporter =
+      payload_.text("processName").value_or(std::string_view()).starts_with(kReporterProcess);
+  std::vector<OpenStream*> gone;
+  for (const auto& stream : streams_) {
+    // Without a link nothing else marks the end of the reporter's sessions.
+    const bool isReporters =
+        isReporter && stream->story().objectSerial && !stream->story().sessionID;
+    if (stream->undecidedSince || isReporters) gone.push_back(stream.get());
+  }
+  for (OpenStream* const stream : gone) {
+    close(*stream, stream->runs() ? StreamEnd::kClientGone : StreamEnd::kStopped,
+          stream->undecidedSince.value_or(message.time));
+  }
+}
+
+void StreamBuilder::settleUndecided(double now) {
+  const std::vector<OpenStream*> undecided = undecided_;
+  for (OpenStream* const stream : undecided) {
+    // Also if the clock was set back.
+    if (std::abs(now - *stream->undecidedSince) <= kSameMoment) continue;
+    close(*stream, StreamEnd::kStopped, *stream->undecidedSince);
+  }
+}
+
+void StreamBuilder::close(OpenStream& stream, StreamEnd end, double time) {
+  stream.end(end, time);
+  const StreamStory& story = stream.story();
+  if (story.sessionID) {
+    const auto found = bySession_.find(*story.sessionID);
+    if (found != bySession_.end() && found->second == &stream) bySession_.erase(found);
+  }
+  if (story.objectSerial) {
+    const auto [begin, last] = bySerial_.equal_range(*story.objectSerial);
+    for (auto place = begin; place != last; ++place) {
+      if (place->second != &stream) continue;
+      bySerial_.erase(place);
+      break;
+    }
+  }
+  forgetProgram(stream);
+  std::erase(undecided_, &stream);
+  onStory_(story);
+  streams_.erase(stream.place);
+}
+
+void StreamBuilder::noteProgram(OpenStream& stream, const Message& message) {
+  // A message of the link alone does not name its application.
+  if (!message.isEvent) return;
+  const std::uint64_t program = programOf(message.application, message.service);
+  if (program != stream.program) forgetProgram(stream);
+  stream.program = program;
+  byProgram_.insert_or_assign(program, &stream);
+}
+
+void StreamBuilder::forgetProgram(const OpenStream& stream) {
+  const auto found = byProgram_.find(stream.program);
+  if (found != byProgram_.end() && found->second == &stream) byProgram_.erase(found);
+}
+
+void StreamBuilder::closeAll(StreamEnd end, double time) {
+  while (!streams_.empty()) {
+    OpenStream& stream = *streams_.front();
+    // A session that had ended did not lose its service.
+    if (stream.undecidedSince) {
+      close(stream, StreamEnd::kStopped, *stream.undecidedSince);
+    } else {
+      close(stream, stream.runs() || end != StreamEnd::kServiceGone ? end : StreamEnd::kStopped,
+            stream.runs() ? time : 0);
+    }
+  }
+}
+
+void StreamBuilder::finish(const Finish& finish) {
+  join_.finish();
+  settleUndecided(lastTime_ + 2 * kSameMoment);
+  if (finish.serviceIsGone) {
+    closeAll(StreamEnd::kServiceGone, lastTime_);
+  } else {
+    closeAll(StreamEnd::kStillRunning, finish.now.value_or(lastTime_));
+  }
+}
+
+}  // namespace halvox::analysis
