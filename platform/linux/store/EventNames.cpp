@@ -33,7 +33,8 @@ EventName* EventNames::find(std::string_view name) {
         count_.fetch_add(1, std::memory_order_relaxed);
         return made.release();
       }
-      // Another thread set the slot first. Its entry is now in `present` and may have this name.
+      // Another thread has set the slot first. Its entry is now in `present`, and may be the entry
+      // of this name.
     }
     // Try the next slot, until the name or an empty slot is found. An empty slot proves that the
     // name is not in the table, because entries are never removed.

@@ -16,12 +16,12 @@ struct EventName {
   const bool isWanted;
 };
 
-// A table of the event names seen so far. Each entry says whether events of that name are stored.
-// Matching the patterns for every message would be too slow. Owned by the store.
+// A table of the event names seen so far. Each entry says whether events of that name are stored,
+// because matching the patterns for every message would be too slow. Owned by the store.
 //
-// Any thread may call, and no call takes a lock: entries are added but never removed, and their
-// constant members never change. The table is bounded, because clients choose names. A name that
-// does not fit is matched again each time.
+// Any thread may call. No call takes a lock, because entries are added but never removed, and their
+// members are constant. The table is bounded, because clients choose the names. A name for which no
+// slot is left is matched again each time.
 class EventNames {
  public:
   // Patterns for fnmatch(3). A name is wanted when at least one of them matches.
@@ -39,14 +39,15 @@ class EventNames {
   static constexpr std::size_t kMostNames = 4096;
 
  private:
-  // Twice the names: half of the slots stay empty, which keeps a search short and makes it end.
+  // Twice as many slots as names. At least about half of the slots stay empty, which keeps searches
+  // short. A search ends at an empty slot.
   static constexpr std::size_t kSlots = 2 * kMostNames;
 
   const std::vector<std::string> wantedPatterns_;
-  // Each slot is set once. Storing with release and loading with acquire make the entry's content
-  // visible to every thread that finds it.
+  // Each slot is set once. It is stored with release and loaded with acquire, and a thread that
+  // finds an entry therefore sees the entry's content.
   std::unique_ptr<std::atomic<EventName*>[]> slots_;
-  // Bounds the growth. Relaxed: no other memory is published through it.
+  // Bounds the number of entries. Relaxed, because it publishes no other memory.
   std::atomic<std::size_t> count_{0};
 };
 

@@ -40,16 +40,16 @@ class IndentedJsonArray::Text {
     isTaken_ = true;
     return text_;
   }
-  // Discards the text that the caller has taken. Called just before text is appended, because the
-  // caller may read the old text until then.
+  // Discards the text that the caller has taken. Called not before new text is appended, because
+  // the caller may read the old text until then.
   void begin() {
     if (isTaken_) text_.clear();
     isTaken_ = false;
   }
 
  private:
-  // Does not put the key into a Dictionary, because Key shares its texts in a bounded table. Keys
-  // that differ each time would fill that table for the life of the process.
+  // Writes the key without making it a Key of a Dictionary: Key keeps its texts in a bounded table
+  // until the process ends, and keys that differ each time would fill that table.
   void appendKey(std::string_view key) {
     key_.Clear();
     rapidjson::Writer<rapidjson::StringBuffer> writer(key_);
@@ -57,9 +57,9 @@ class IndentedJsonArray::Text {
     text_.append(key_.GetString(), key_.GetSize());
   }
 
-  // Appends compact JSON with line breaks and indents. Parsing would be slower and is not needed:
-  // the text comes from the encoder and is well-formed. Speed matters because the stop of a session
-  // waits for this, and every other request waits for the stop.
+  // Appends compact JSON, and inserts line breaks and indents. Does not parse the text, because the
+  // encoder's text is well-formed and parsing would be slower. Speed matters: the stop of a session
+  // waits for this function, and every other request waits for the stop.
   void indent(std::string_view json) {
     std::size_t depth = kObjectDepth;
     for (std::size_t at = 0; at < json.size(); ++at) {

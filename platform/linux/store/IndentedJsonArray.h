@@ -7,9 +7,9 @@
 
 namespace halvox::platform::linux_ {
 
-// Writes a JSON array of objects as indented text. The caller takes the text in pieces, so that an
-// array of any length needs the memory of one object. Values have the form that PayloadEncoder
-// documents. Belongs to one thread. Cannot fail.
+// Writes a JSON array of objects as indented text. The caller takes the text in pieces. An array of
+// any length therefore needs only the memory of one object. Values have the form that
+// PayloadEncoder documents. Belongs to one thread. Cannot fail.
 class IndentedJsonArray {
  public:
   IndentedJsonArray();

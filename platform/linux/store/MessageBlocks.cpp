@@ -7,13 +7,15 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Enough records for a block: 85 messages with two events and a link message each. Messages take
-// twice as many bytes in blocks of 32 messages as in blocks of 340.
+// Open rows become a sealed block when they have this many records, which are 85 messages with two
+// events and a link message each. Fewer would cost space: messages take twice as many bytes in
+// blocks of 32 messages as in blocks of 340.
 constexpr std::uint64_t kRecordsToSeal = 256;
-// An open row with fewer records fits into the page that its commit writes anyway.
+// An open row with fewer records is not compressed, because it fits into the page that its commit
+// writes in any case.
 constexpr std::uint64_t kRecordsToCompress = 24;
-// Larger blocks save few bytes. A reader that wants one record unpacks a whole block, which takes
-// 1 ms at this size.
+// A sealed block has at most this many records. Larger blocks would save few bytes, and a reader
+// that wants one record unpacks a whole block, which takes 1 ms at this size.
 constexpr std::uint64_t kMostRecords = 1024;
 constexpr std::uint64_t kMostBytes = std::uint64_t{256} * 1024;
 
@@ -27,7 +29,7 @@ SqliteCode MessageBlocks::prepare(Database& database) {
   for (const auto& [statement, sql] :
        {std::pair<Statement*, std::string>{
             &statements_.insertBlock,
-            // The row may replace the block without records that stores the next number.
+            // REPLACE, because a row without records may exist that stores the next number.
             "INSERT OR REPLACE INTO message_blocks VALUES (?1, ?2, ?3, ?4, ?5)"},
         {&statements_.insertSpan, "INSERT OR REPLACE INTO message_spans VALUES (?1, ?2, ?3, ?4)"},
         {&statements_.newest, "SELECT id, records FROM message_blocks ORDER BY id DESC LIMIT 1"},
@@ -75,8 +77,9 @@ SqliteCode MessageBlocks::readState() {
   if (code != SQLITE_DONE) return code;
   isStateKnown_ = true;
   clearGathered();
-  // Open rows of an earlier run get a block of their own. If a block had records of both runs, a
-  // store that replaces a damaged database could not copy only those of this run.
+  // Seal open rows of an earlier run now, without records of this run. After damage, the store
+  // copies only the blocks of this run into a new database, and a block with records of both runs
+  // could not be divided.
   return firstOpen_ < next_ ? sealOpenRows() : SQLITE_OK;
 }
 
@@ -89,8 +92,8 @@ SqliteCode MessageBlocks::begin(std::uint64_t records) {
   return open > 0 && isEnough ? gatherOpenRows() : SQLITE_OK;
 }
 
-// Moves the open rows into writer_ and deletes them. The sealed block will have the number of the
-// first one.
+// Moves the records of the open rows into writer_ and deletes the rows. The sealed block gets the
+// number of the first row.
 SqliteCode MessageBlocks::gatherOpenRows() {
   gathered_.first = firstOpen_;
   SqliteCode code = SQLITE_ROW;
@@ -116,7 +119,7 @@ SqliteCode MessageBlocks::sealOpenRows() {
   return code == SQLITE_OK ? insert(Row::kSealed) : code;
 }
 
-// Adds the records of a block to writer_. Those older than `newerThan` become gaps.
+// Adds the records of a block to writer_. Records older than `newerThan` become gaps.
 SqliteCode MessageBlocks::gatherBlock(std::string_view block, std::int64_t records,
                                       std::optional<double> newerThan) {
   reader_.open(block, records);
@@ -173,7 +176,7 @@ SqliteCode MessageBlocks::end() {
   return insert(writer_.records() >= kRecordsToSeal ? Row::kSealed : Row::kOpen);
 }
 
-// Writes writer_'s records into a row.
+// Writes the records of writer_ into a row.
 SqliteCode MessageBlocks::insert(Row row) {
   const bool isShort = row == Row::kOpen && writer_.records() < kRecordsToCompress;
   const std::string_view block =
@@ -243,7 +246,8 @@ SqliteCode MessageBlocks::deleteRow(std::int64_t id, std::int64_t records) {
   if (code != SQLITE_OK) return code;
   if (id >= firstOpen_) firstOpen_ = id + records;
   if (id + records != next_) return SQLITE_OK;
-  // This was the newest row. A row without records keeps the next number.
+  // The deleted row was the newest one, and the next number follows from the newest row. Add a row
+  // without records to keep that number.
   statements_.insertBlock.bind(1, next_);
   statements_.insertBlock.bind(2, std::int64_t{0});
   statements_.insertBlock.bind(3, 0.0);

@@ -10,17 +10,18 @@
 
 namespace halvox::platform::linux_ {
 
-// The rows of `message_blocks`: each holds one or more consecutive records and has the number of
-// the first one as its ID. Numbers only grow, even after all records were deleted: readers that
-// follow the store rely on it.
+// Writes and deletes the rows of `message_blocks`. Each row holds one or more consecutive records;
+// its ID is the number of the first one. Record numbers only grow, even after all records were
+// deleted, because readers that follow the store rely on it.
 //
 //   open     few records, as they came in one transaction; the newest rows, without a span
 //   sealed   many records, compressed, with a row of `message_spans`
 //
-// A transaction of many records writes only sealed blocks. A transaction of few records writes an
-// open row, so that they are safe. When enough records have gathered, the open rows become one
-// sealed block with the same numbers. No timer does that: open rows of a quiet store stay, and
-// readers read them like all others.
+// A transaction of many records writes only sealed blocks. A transaction of few records writes them
+// at once, into an open row, because answered messages must be in the database soon. When the open
+// rows have enough records, a later transaction makes them one sealed block with the same numbers.
+// There is no timer for this: the open rows of a quiet store stay open, and readers read them like
+// all others.
 //
 // Owned by MessageRecords and used by the writer's thread only. Works in the open transaction,
 // except for prepare(). Functions that use the database return SQLITE_OK or an error; after an
@@ -39,20 +40,20 @@ class MessageBlocks {
   // See MessageBlockWriter.
   [[nodiscard]] SqliteCode addEvent(double time, const EventHead& head, std::string_view payload);
   [[nodiscard]] SqliteCode addLink(double time, const LinkHead& head, std::string_view payload);
-  // Writes what is not written yet.
+  // Writes the records that are not in a row yet.
   [[nodiscard]] SqliteCode end();
-  // The length of this transaction's records before compression, in bytes.
+  // Returns the length of this transaction's records before compression, in bytes.
   [[nodiscard]] std::uint64_t bytes() const { return sealedBytes_ + writer_.bytes(); }
 
   void onCommitted() { sealedBytes_ = 0; }
-  // Called after a failed transaction. Its numbers will be used again.
+  // Called after a failed transaction. The numbers of its records will be used again.
   void onRolledBack();
 
   // See RecordKind.
   [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time);
   [[nodiscard]] SqliteCode deleteOldest(bool& found);
-  // Deletes the records of one block that are older than `time`. If others remain, writes the block
-  // again with gaps.
+  // Deletes the records of one block that are older than `time`. If newer records remain, writes
+  // the block again with gaps.
   [[nodiscard]] SqliteCode deleteOlderThan(double time, bool& found);
 
  private:
@@ -98,7 +99,8 @@ class MessageBlocks {
   Gathered gathered_;
   std::uint64_t sealedBytes_ = 0;  // of the blocks that this transaction has written
 
-  // Known after readState(). Unknown after opening the database and after a rollback.
+  // True if the members below are known: after readState(), until the database is opened again or a
+  // transaction is rolled back.
   bool isStateKnown_ = false;
   std::int64_t next_ = 1;        // the number of the next record
   std::int64_t firstOpen_ = 1;   // the number of the first record in an open row

@@ -17,14 +17,14 @@ using ::testing::SizeIs;
 
 constexpr double kNow = 1'700'000'000;
 constexpr double kDay = 86'400;
-// More records than one row without a span has.
+// More records than an open row can have.
 constexpr std::int64_t kMany = 700;
 
 class MessageBlocksTest : public StoreFixture {
  protected:
   MessageBlocksTest() { platform.clock.setCurrentDate({kNow}); }
 
-  // Sends an event and waits until it is stored, so that it has a transaction of its own.
+  // Sends an event and waits until it is stored. The event then has a transaction of its own.
   void sendAlone(std::int64_t number) {
     send(number);
     ASSERT_TRUE(allIsStored());
@@ -41,7 +41,7 @@ class MessageBlocksTest : public StoreFixture {
     const auto found = rows(database(), sql);
     return found.empty() ? "" : found.front();
   }
-  // Reads events with the library of the tools.
+  // Reads events with StoreReader, as the tools do.
   std::vector<std::string> read(const RecordFilter& filter) {
     std::vector<std::string> texts;
     StoreReader reader;
@@ -50,7 +50,7 @@ class MessageBlocksTest : public StoreFixture {
         filter, [&](const StoredEvent& event) { texts.emplace_back(event.payload); }));
     return texts;
   }
-  // The same for link messages. The last text is the error, if there is one.
+  // Reads link messages in the same way. If there is an error, the last text is its message.
   std::vector<std::string> readLink(const RecordFilter& filter) {
     std::vector<std::string> texts;
     StoreReader reader;
@@ -202,8 +202,8 @@ TEST_F(MessageBlocksTest, ReaderReportsADamagedBlockAfterTheRecordsBeforeIt) {
 
 class MessageKeysTest : public MessageBlocksTest {
  protected:
-  // Stores blocks of three sessions, one after the other, and damages all blocks but those of the
-  // second: a reader of one of them gets an error.
+  // Stores blocks of three sessions, one after the other, and damages all blocks except those of
+  // the second session. A reader that unpacks a damaged block gets an error.
   void storeSessions() {
     start();
     for (std::int64_t session = 1; session <= 3; ++session) {
@@ -216,7 +216,7 @@ class MessageKeysTest : public MessageBlocksTest {
         sendLink(session, number);
       }
       ASSERT_TRUE(allIsStored());
-      // Opening again seals the open rows, which have no keys.
+      // Open rows have no keys. Opening the store again seals them.
       start();
     }
     stop();
@@ -258,7 +258,7 @@ TEST_F(MessageKeysTest, QueriesReadOnlyTheBlocksOfASessionOrAnApplication) {
     EXPECT_EQ(value("SELECT count(*) FROM " + condition), "700") << condition;
   }
   EXPECT_EQ(value("SELECT count(*) FROM link_messages WHERE client_name = 'other'"), "0");
-  // What has no key reads all blocks.
+  // A condition for which there is no key reads all blocks.
   for (const std::string condition :
        {"link_messages WHERE session_id = '2.0'", "link_messages WHERE session_id > 1",
         "analytics_events WHERE name = 'COM.tarno.event2' COLLATE NOCASE"}) {
@@ -266,7 +266,7 @@ TEST_F(MessageKeysTest, QueriesReadOnlyTheBlocksOfASessionOrAnApplication) {
   }
 }
 
-// A store of the version before blocks: one event with its twin, one link message.
+// Fills a store of the last version without blocks: one event with its twin, and one link message.
 void makeVersion2(const std::filesystem::path& database) {
   execute(database,
           "INSERT INTO event_names VALUES (1, 'com.tarno.a'), (2, 'com.tarno.b');"
@@ -308,7 +308,8 @@ TEST_F(MessageBlocksTest, NumbersContinueAfterThoseOfTheVersionBefore) {
   start();
   send(1);
   stop();
-  // After the span of 512 records that the old events are in: two events each.
+  // The old events are in a span of 512 records with two events each. New numbers begin after that
+  // span.
   EXPECT_EQ(value("SELECT id > 2 * 511 + 1 FROM message_blocks"), "1");
 }
 

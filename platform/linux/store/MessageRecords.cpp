@@ -9,8 +9,8 @@ namespace {
 
 constexpr UnitLog kLog{storeCategory, "MessageRecords"};
 
-// Memory for this many records is kept between rounds: as many as the queue's soft limit. Memory
-// that a burst needed beyond that is freed.
+// Between rounds, keep memory for this many records, which is the soft limit of the queue. Free the
+// memory that a burst needed beyond that.
 constexpr std::size_t kKeptRecords = 8192;
 
 }  // namespace
@@ -24,13 +24,15 @@ MessageRecords::MessageRecords(EventNames& names, WriterQueue& queue, Statistics
       longestPayload_(longestPayload) {}
 
 void MessageRecords::addEvent(double time, std::string_view name, AnalyticsPayloadBuilder builder) {
-  // Look the name up outside the queue's lock, which all senders share. The look-up needs no lock.
+  // Look the name up before add() takes the queue's lock, which all senders share. The look-up
+  // itself needs no lock.
   Event event{time, names_.find(name), nullptr, std::move(builder)};
   if (event.name == nullptr) {
     event.ownName = std::make_unique<EventName>(name, true);
     event.name = event.ownName.get();
   }
-  // Count before waiting for room, so that the counts include callers that wait.
+  // Count before add(), which may wait for room. The counts then include records whose callers
+  // wait.
   events_.counters.addReceived();
   if (!queue_.add([&] { queued_.emplace_back(std::move(event)); })) {
     events_.counters.addDropped(DropReason::kClosed, 1);
@@ -46,7 +48,7 @@ bool MessageRecords::addLink(LinkMessageRecord record) {
 
 void MessageRecords::takeQueued() {
   taken_.clear();
-  // Free the memory before the swap: the emptied vector is the one to which records are added next.
+  // Free the memory before the swap, because callers add the next records to this vector.
   if (taken_.capacity() > kKeptRecords) taken_ = std::vector<Record>();
   taken_.swap(queued_);
   next_ = 0;
@@ -64,7 +66,7 @@ SqliteCode MessageRecords::write(TransactionAllowance& allowance) {
 }
 
 SqliteCode MessageRecords::writeNext(TransactionAllowance& allowance) {
-  // Move the record out: its memory is freed at once, not after the whole batch.
+  // Move the record out of the vector. Its memory is then freed at once, not after the whole batch.
   Record record = std::move(taken_[next_]);
   Port& port = portOf(record);
   ++next_;
@@ -98,7 +100,7 @@ SqliteCode MessageRecords::writeNext(TransactionAllowance& allowance) {
   return code;
 }
 
-// The two events of a message have equal payloads, which are encoded once.
+// The two events of a message have equal payloads. Encodes the payload only for the first of them.
 std::string_view MessageRecords::encode(Dictionary payload) {
   if (lastText_.empty() || !encodeAlike(payload, lastPayload_)) {
     lastText_ = encoder_.encode(payload);
@@ -119,7 +121,8 @@ void MessageRecords::onCommitted(FinishedRecords& finished) {
 void MessageRecords::endTransaction(FinishedRecords& finished) {
   lastText_ = {};
   lastPayload_ = {};
-  // The next record may come after hours. The text of a long session's summary is many megabytes.
+  // Free the memory of a long text, because the next record may come only after hours. The summary
+  // of a long session has many megabytes.
   encoder_.giveBack();
   if (!hasTaken()) {
     taken_.clear();

@@ -21,7 +21,7 @@
 
 namespace halvox::platform::linux_ {
 
-// A message of the real-time link, as its adapter queues it.
+// A message of the real-time link, as the adapter of the local link queues it.
 struct LinkMessageRecord {
   double time = 0;                         // seconds since 1970
   std::shared_ptr<const LinkParty> party;  // held by the session and by its waiting messages
@@ -31,9 +31,9 @@ struct LinkMessageRecord {
 };
 
 // The analytics events and the link messages of the store. One message of a client makes two events
-// and, with the local link, a link message. They arrive through different ports but have nearly the
-// same payload. All three go into the same blocks, where compression removes what they share. No
-// port has to say which records belong together.
+// and, with the local link, a link message. These three records arrive through different ports but
+// have nearly the same payload. All go into the same blocks, where compression removes what they
+// share. The ports therefore need not say which records belong together.
 // Threads, owner and failures are those of RecordKind.
 class MessageRecords final : public RecordKind {
  public:
@@ -41,10 +41,10 @@ class MessageRecords final : public RecordKind {
   MessageRecords(EventNames& names, WriterQueue& queue, StatisticsService& statistics,
                  std::uint64_t longestPayload);
 
-  // Any thread. Queues an event with its time (seconds since 1970). Waits while the queue is full;
-  // counts the event as dropped when the store is closed.
+  // Any thread. Queues an event with its time (seconds since 1970). Waits while the queue is full.
+  // If the store is closed, counts the event as dropped.
   void addEvent(double time, std::string_view name, AnalyticsPayloadBuilder builder);
-  // The same for a link message. Returns false when the store is closed.
+  // Does the same for a link message. Returns false if the store is closed.
   bool addLink(LinkMessageRecord record);
 
   [[nodiscard]] SqliteCode prepare(Database& database) override;
@@ -96,7 +96,8 @@ class MessageRecords final : public RecordKind {
 
   std::vector<Record> queued_;  // guarded by the lock of the WriterQueue
 
-  // Used by the writer's thread only. Records before next_ are written, and their content freed.
+  // Used by the writer's thread only. Records before next_ have been written and their content is
+  // freed.
   std::vector<Record> taken_;
   std::size_t next_ = 0;
   PayloadEncoder encoder_;
@@ -107,12 +108,13 @@ class MessageRecords final : public RecordKind {
   OncePerSecond tooLargeLines_;
 };
 
-// What the local link may do with the records: add link messages. The store owns both objects.
+// The part of MessageRecords that the local link may use: adding link messages. The store owns both
+// objects.
 class LinkMessageRecords {
  public:
   explicit LinkMessageRecords(MessageRecords& records) : records_(records) {}
-  // Any thread. Waits while the queue is full, but never for the disk itself. Returns false when
-  // the store is closed; then the message is dropped and counted.
+  // Any thread. Waits while the queue is full, but never for the disk itself. If the store is
+  // closed, drops and counts the message and returns false.
   bool add(LinkMessageRecord record) { return records_.addLink(std::move(record)); }
 
  private:

@@ -9,12 +9,12 @@
 
 namespace halvox::platform::linux_ {
 
-// The records of a kind that an earlier version stored one to a row. They stay where they are until
-// retention deletes them. New records go elsewhere.
+// The records that an earlier version stored in one row each, in tables to which nothing is added
+// any more. They stay there until retention deletes them.
 // Threads, owner and failures are those of RecordKind.
 class OldRecords final : public RecordKind {
  public:
-  // The names of the kind's tables. They are not copied: pass constants.
+  // The names of the kind's tables. Pass constants, because the names are not copied.
   OldRecords(std::string_view records, std::string_view spans) : spans_(records, spans) {}
 
   [[nodiscard]] SqliteCode prepare(Database& database) override { return spans_.prepare(database); }

@@ -30,8 +30,8 @@ constexpr double kEnd = 253402300800.0;       // 10000-01-01
 
 enum class TextKind : std::uint8_t { kPlain, kEscapesNeeded, kNotAscii };
 
-// Tests eight bytes at a time: nearly all texts are plain, and are then copied without further
-// tests.
+// Tests eight bytes at a time. Nearly all texts are plain, and a plain text is copied without
+// further tests.
 TextKind classify(std::string_view text) {
   constexpr std::uint64_t kOnes = 0x0101010101010101U;
   constexpr std::uint64_t kHighs = kOnes * 0x80U;
@@ -41,9 +41,9 @@ TextKind classify(std::string_view text) {
     const std::uint64_t quotes = word ^ (kOnes * '"');
     const std::uint64_t backslashes = word ^ (kOnes * '\\');
     high |= word;
-    // Each line sets the high bit of a byte that is below 0x20, a quote or a backslash. The
-    // subtraction may also mark the byte above such a byte. That is harmless: only whether any
-    // byte is marked matters.
+    // The three lines set the high bit of each byte that is below 0x20, a quote or a backslash. The
+    // borrow of a subtraction may also mark the byte above such a byte. This does no harm, because
+    // it only matters whether any byte is marked.
     special |= (word - kOnes * 0x20U) & ~word;
     special |= (quotes - kOnes) & ~quotes;
     special |= (backslashes - kOnes) & ~backslashes;
@@ -109,7 +109,7 @@ bool alikeNumbers(const Value& left, const Value& right) {
   switch (left.numberKind()) {
     case NumberKind::kFloat:
     case NumberKind::kDouble:
-      // Compare bits: 0.0 and -0.0 are equal but differ as text.
+      // Compare the bits, because 0.0 and -0.0 are equal but have different texts.
       return std::bit_cast<std::uint64_t>(left.toDouble()) ==
              std::bit_cast<std::uint64_t>(right.toDouble());
     case NumberKind::kUInt64:
@@ -149,9 +149,9 @@ bool alike(const Value& left, const Value& right) {
 
 }  // namespace
 
-// Extends RapidJSON's writer with faster code for plain texts and numbers: RapidJSON writes them
-// one character at a time. Derives from it because Prefix(), which keeps track of commas and
-// nesting, is protected.
+// Extends RapidJSON's writer with faster code for plain texts and numbers, which RapidJSON writes
+// one character at a time. Derives from the writer because its function Prefix(), which keeps track
+// of commas and nesting, is protected.
 class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> {
  public:
   Text() { Reset(buffer_); }
@@ -164,7 +164,7 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
     return {buffer_.GetString(), buffer_.GetSize()};
   }
 
-  // One large payload must not hold its memory for the life of the service.
+  // Frees the memory of a large payload. It would otherwise stay allocated until the service ends.
   void giveBack() {
     if (buffer_.stack_.GetCapacity() > kKeptBufferBytes) buffer_ = rapidjson::StringBuffer();
   }
@@ -212,8 +212,8 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
       case TextKind::kEscapesNeeded:
         return addEscaped(text);
       case TextKind::kNotAscii:
-        // Texts from files or other processes may contain any bytes. RapidJSON would copy their
-        // bytes, and readers would refuse the whole payload.
+        // Texts from files or other processes may contain any bytes. RapidJSON would copy invalid
+        // bytes, and readers would then refuse the whole payload.
         return addEscaped(replaceInvalidUtf8(text));
     }
   }
@@ -235,7 +235,7 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
       case NumberKind::kBool:
         Bool(value.toBool());
         return;
-      // Do not write it as a double: the shortest form of 0.1F is "0.1" as a float, and
+      // Do not write a float as a double. The shortest form of 0.1F is "0.1" as a float, but
       // "0.10000000149011612" as a double.
       case NumberKind::kFloat:
         return addReal(static_cast<float>(value.toDouble()));
@@ -255,7 +255,7 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
 
   template <typename Real>
   void addReal(Real number) {
-    // JSON has no such numbers. RapidJSON's writer would refuse them and leave the object
+    // JSON has no NaN and no infinities. RapidJSON's writer would refuse them and leave the object
     // incomplete.
     if (std::isnan(number)) return addPlain("NaN");
     if (std::isinf(number)) return addPlain(number > 0 ? "Infinity" : "-Infinity");
@@ -272,7 +272,8 @@ class PayloadEncoder::Text : private rapidjson::Writer<rapidjson::StringBuffer> 
 
   void addDate(Date date) {
     const double seconds = date.secondsSince1970;
-    // The condition is negated so that NaN does not count as a date.
+    // Negate the condition: every comparison with NaN is false, and NaN is then not written as a
+    // date.
     if (!(seconds >= kEarliest && seconds < kEnd)) return addReal(seconds);
     std::array<char, 64> buffer;
     addPlain(dateText(seconds, buffer));

@@ -16,8 +16,8 @@ namespace halvox::platform::linux_ {
 //   NaN, infinities  the texts "NaN", "Infinity" and "-Infinity", which JSON has no numbers for
 //   text             as it is; each byte that is not part of valid UTF-8 becomes U+FFFD
 //
-// Belongs to one thread. Keeps its buffer between texts, unless a text was longer than 256 KiB
-// and giveBack() or encode() is called after it.
+// Belongs to one thread. Keeps its buffer between texts. After a text longer than 256 KiB, the next
+// giveBack() or encode() frees the buffer.
 class PayloadEncoder {
  public:
   PayloadEncoder();
@@ -36,8 +36,8 @@ class PayloadEncoder {
 };
 
 // Compares two dictionaries without encoding them. Returns true only if both encode to the same
-// text. May return false for equal texts; the store then writes the payload twice. Comparing with
-// == would be wrong: 1 and true are equal values with different texts.
+// text. May return false although the texts are equal; the store then encodes the payload twice.
+// The operator == would be wrong, because 1 and true are equal values with different texts.
 [[nodiscard]] bool encodeAlike(const Dictionary& left, const Dictionary& right);
 
 }  // namespace halvox::platform::linux_

@@ -37,8 +37,8 @@ class OpenStore {
 
   linux_::SqliteStore& store() { return *store_; }
   const ClockService& clock() const { return platform_.clock; }
-  // Closes the store, which writes everything, and returns the rows of a query: columns joined by
-  // '|'.
+  // Closes the store, which then writes everything. Returns the rows of a query, with their columns
+  // joined by '|'.
   std::vector<std::string> rows(std::string_view query) {
     store_->close();
     return linux_::rows(scratch_.path() / "state" / "halvox.db", query);

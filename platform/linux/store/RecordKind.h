@@ -19,27 +19,28 @@ enum class DropReason : std::uint8_t {
   kClosed,       // the record was added after SqliteStore::close()
 };
 constexpr std::size_t kDropReasons = 7;
-// The name under which the drops of that reason are counted, such as "dropped: disk full".
+// Returns the name of the counter for that reason, such as "dropped: disk full".
 [[nodiscard]] std::string_view counterName(DropReason reason);
 
-// How much may still be added to the open transaction.
+// How much may still be written into the open transaction.
 struct TransactionAllowance {
   std::int64_t records;
   std::int64_t payloadBytes;
   [[nodiscard]] bool isUsedUp() const { return records <= 0 || payloadBytes <= 0; }
 };
 
-// How many records left the queue, stored or dropped. WriterQueue::finish() needs these numbers.
+// How many records no longer wait, because they were stored or dropped. WriterQueue::finish() needs
+// these numbers.
 struct FinishedRecords {
   std::uint64_t written = 0;       // written into a transaction, committed or not
   std::uint64_t writtenBytes = 0;  // the length of their payloads
   std::uint64_t unwritten = 0;     // dropped before they were written
 };
 
-// One kind of record: its tables, its waiting records, and how they are written and deleted.
-// The store owns its kinds. The writer's thread calls all functions here; the derived classes have
-// a function to add records, which any thread may call. Functions that use the database return an
-// SQLite code; after an error the store rolls back and calls dropTaken().
+// One kind of record: its tables, its waiting records, and the code that writes and deletes them.
+// The store owns its kinds. Only the writer's thread calls the functions of this class. Derived
+// classes have a function that adds records, which any thread may call. Functions that use the
+// database return an SQLite code; after an error the store rolls back and calls dropTaken().
 //
 //   queued --takeQueued--> taken --write--> written --onCommitted--> stored
 //                            |                 |
@@ -56,8 +57,8 @@ class RecordKind {
   // Finalizes all statements, before each closing of the database.
   virtual void release() = 0;
 
-  // Moves the queued records to the writer's side, which must be empty. The caller holds the lock
-  // of the WriterQueue.
+  // Moves all queued records to the list of taken records, which must be empty. The caller holds
+  // the lock of the WriterQueue.
   virtual void takeQueued() = 0;
   // Returns true while taken records wait to be written.
   [[nodiscard]] virtual bool hasTaken() const = 0;
@@ -67,16 +68,17 @@ class RecordKind {
   [[nodiscard]] virtual SqliteCode write(TransactionAllowance& allowance) = 0;
   // Called after a successful commit. Counts the records as stored and adds them to `finished`.
   virtual void onCommitted(FinishedRecords& finished) = 0;
-  // Called after a failure. Drops the records of the transaction and the taken ones that are not
-  // yet written, counts them under the reason and adds them to `finished`. Returns their number.
+  // Called after a failure. Drops the records of the transaction and the taken records that are not
+  // written yet, counts them under the reason and adds them to `finished`. Returns their number.
   virtual std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) = 0;
 
   // Sets `time` to the time of the oldest record (seconds since 1970), or to std::nullopt if there
   // is no record.
   [[nodiscard]] virtual SqliteCode oldestTime(std::optional<double>& time) = 0;
 
-  // Delete a few records in the open transaction: the oldest, or those older than `time` (seconds
-  // since 1970). `found` says whether there were any; call again while it is true.
+  // These functions delete a few records in the open transaction: the oldest ones, or some that are
+  // older than `time` (seconds since 1970). They set `found` to whether there were any. Call them
+  // again while it is true.
   [[nodiscard]] virtual SqliteCode deleteOldest(bool& found) = 0;
   [[nodiscard]] virtual SqliteCode deleteOlderThan(double time, bool& found) = 0;
 };

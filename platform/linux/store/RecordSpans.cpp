@@ -10,7 +10,7 @@ namespace halvox::platform::linux_ {
 namespace {
 
 // How many records deleteOldest() deletes. The number is small, because payloads may be large and
-// retention measures the free space after each step.
+// retention must measure the free space after each step.
 constexpr std::int64_t kRecordsPerStep = 64;
 
 // Returns the statement with the names of the tables in place of $records and $spans.
@@ -39,7 +39,8 @@ SqliteCode RecordSpans::prepare(Database& database) {
             " last_time = max(last_time, excluded.last_time)"},
         {&statements_.oldestRecord, "SELECT id, time FROM $records ORDER BY id LIMIT 1"},
         {&statements_.deleteRecords, "DELETE FROM $records WHERE id BETWEEN ?1 AND ?2"},
-        // Keep the newest span when its records are deleted: the next number derives from it.
+        // Keep the newest span even if its records are deleted, because the next number derives
+        // from it.
         {&statements_.deleteEmptySpans,
          "DELETE FROM $spans WHERE span < ?1 AND span < (SELECT max(span) FROM $spans)"},
         {&statements_.agedSpan,
@@ -81,7 +82,8 @@ SqliteCode RecordSpans::note(double time) {
     span_.lastTime = std::max(span_.lastTime, time);
     return SQLITE_OK;
   }
-  // This is the first record of the next span: the times of the previous span are complete.
+  // This is the first record of the next span. The times of the previous span are complete and can
+  // be written.
   const SqliteCode code = flush();
   span_ = {number, time, time};
   return code;
@@ -139,9 +141,10 @@ SqliteCode RecordSpans::deleteOlderThan(double time, bool& found) {
   statements_.deleteAgedRecords.bind(3, time);
   code = statements_.deleteAgedRecords.run();
   if (code != SQLITE_OK) return code;
-  // Raise the span's first time to the limit, or the next call would find the same span again. If
-  // the true first time is later, a future call examines the span once without need. deleteOldest()
-  // deletes the row when it deletes later records.
+  // Raise the span's first time to the limit. The next call would otherwise find the same span
+  // again. If the span's oldest record is in truth newer than the limit, a later call examines the
+  // span once without need. The row of the span stays; deleteOldest() deletes it together with
+  // later records.
   statements_.shortenSpan.bind(1, span);
   statements_.shortenSpan.bind(2, time);
   return statements_.shortenSpan.run();

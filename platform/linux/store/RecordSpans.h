@@ -8,16 +8,16 @@
 
 namespace halvox::platform::linux_ {
 
-// Numbers the records of one kind and keeps the first and the last time of each span of
-// kRecordsPerSpan records. Deletes the oldest records, by number or by time; the spans make an
-// index on the time unnecessary.
+// Numbers the records of one kind, and stores the first and the last time of each span of
+// kRecordsPerSpan records. Deletes the oldest records by number, or by time with the help of the
+// spans, which make an index on the time unnecessary.
 // Owned by a RecordKind and used by the writer's thread only. Works in the open transaction, except
 // for prepare(). Functions that use the database return SQLITE_OK or an error.
 //
 // For each record: note() its times, then advance(). Before the commit: flush().
 class RecordSpans {
  public:
-  // The names of the kind's tables. They are not copied: pass constants.
+  // The names of the kind's tables. Pass constants, because the names are not copied.
   RecordSpans(std::string_view records, std::string_view spans)
       : recordsTable_(records), spansTable_(spans) {}
 
@@ -26,17 +26,17 @@ class RecordSpans {
   // Finalizes all statements, before each closing of the database.
   void release() { statements_ = {}; }
 
-  // The number of the next record. Numbers only grow, even after all records were deleted: readers
-  // that follow the store rely on it.
+  // Returns the number of the next record. Numbers only grow, even after all records were deleted,
+  // because readers that follow the store rely on it.
   [[nodiscard]] std::int64_t next() const { return next_; }
   // Adds a time (seconds since 1970) to the span of the next record.
   [[nodiscard]] SqliteCode note(double time);
-  // Moves on to the number after next(), once that record is written.
+  // Increases next(). Call it when the record with the number next() has been written.
   void advance() { ++next_; }
   // Writes the times of the current span.
   [[nodiscard]] SqliteCode flush();
   void onCommitted() { nextCommitted_ = next_; }
-  // Called after a failed transaction, whose numbers will be used again.
+  // Called after a failed transaction. The numbers of its records will be used again.
   void onRolledBack();
 
   // See RecordKind.

@@ -15,8 +15,9 @@ struct RecordColumn {
   ColumnType type;
 };
 
-// Describes one kind of record that is stored one to a row. The writer, the readers and retention
-// make their SQL from it. Names and columns must agree with the migrations in StoreSchema.cpp.
+// Describes one kind of record of which each has a row of its own. The writer, the readers and
+// retention make their SQL from this description. Names and columns must agree with the migrations
+// in StoreSchema.cpp.
 struct RecordTable {
   std::string_view records;               // the table of the records
   std::string_view spans;                 // the table of their first and last times

@@ -10,13 +10,15 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::chrono::minutes kAgeInterval{1};
-// The most steps in one transaction, so that waiting records are not held up for long. A step by
-// age covers a span of 512 records of each kind. A step by size deletes 64 records: 128 steps
-// delete 8,192, twice what one transaction can add. Retention therefore keeps up with any rate of
-// writing.
+// The largest number of steps in one transaction. It is bounded because waiting records must not be
+// held up for long. A step by age covers one span (512 records) or one block of messages of each
+// kind. A step by size deletes 64 records, or one block of messages. 128 steps usually delete 8,192
+// records or more, twice as many as one transaction can add. Retention therefore keeps up with any
+// rate of writing.
 constexpr int kAgeSteps = 16;
 constexpr int kSizeSteps = 128;
-// How much is deleted ahead: this share of the database, at most this many bytes.
+// How much retention deletes in advance when the database is full: 1/kShareAhead of the largest
+// size, but at most kMostAhead bytes.
 constexpr std::uint64_t kShareAhead = 16;
 constexpr std::uint64_t kMostAhead = std::uint64_t{2} << 20U;
 constexpr std::uint64_t kLeastPage = 512;  // SQLite's smallest page
@@ -28,8 +30,8 @@ SqliteCode readInteger(Statement& statement, std::uint64_t& value) {
   return code == SQLITE_ROW ? SQLITE_OK : code;
 }
 
-// Deletes from the kind that has the oldest record of all. A flood of one kind then displaces its
-// own records and older ones, never newer ones of another kind.
+// Deletes from the kind that has the oldest record of all. A flood of one kind therefore displaces
+// only records that are older than its own, never newer records of another kind.
 SqliteCode deleteOldest(std::span<RecordKind* const> kinds, bool& found) {
   RecordKind* oldest = nullptr;
   double oldestTime = 0;
@@ -45,7 +47,7 @@ SqliteCode deleteOldest(std::span<RecordKind* const> kinds, bool& found) {
   return oldest == nullptr ? SQLITE_OK : oldest->deleteOldest(found);
 }
 
-// Runs one step for each kind. `found` is true when any of them found something.
+// Runs one step for each kind. Sets `found` to whether the step of any kind found records.
 template <typename Step>
 SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
   found = false;
@@ -61,10 +63,11 @@ SqliteCode stepAll(std::span<RecordKind* const> kinds, bool& found, Step step) {
 }  // namespace
 
 SqliteCode Retention::prepare(Database& database) {
-  // Read the size from SQLite: a database that another program made may have pages of another size.
+  // Read the size of a page from SQLite, because a database that another program made may have
+  // another page size than ours.
   pageBytes_ = static_cast<std::uint64_t>(database.queryInteger("PRAGMA page_size").value_or(0));
-  // Vacuum writes each moved page to the log. Move so few pages at a time that the log does not
-  // outgrow its limit.
+  // Vacuum writes each page that it moves to the write-ahead log. Move so few pages at a time that
+  // the log does not outgrow its limit.
   const std::uint64_t vacuumPages =
       limits_.transactionBytes / (2 * std::max(pageBytes_, kLeastPage));
   const std::string vacuum = "PRAGMA incremental_vacuum(" + std::to_string(vacuumPages) + ")";
@@ -89,7 +92,8 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
   const bool byAge = std::chrono::steady_clock::now() >= nextByAge_;
   SqliteCode code = readUse();
   if (code != SQLITE_OK) return code;
-  // The usual case. It must not begin a transaction, because this runs after every transaction.
+  // Usually nothing is to be deleted. Return without a transaction then, because this function runs
+  // after every transaction of the store.
   if (!byAge && !isFull() && fileBytes() <= limits_.databaseBytes) return SQLITE_OK;
 
   const std::uint64_t before = fileBytes();
@@ -110,8 +114,8 @@ SqliteCode Retention::runOnce(double now, std::span<RecordKind* const> kinds, bo
 }
 
 bool Retention::isFull(std::uint64_t more) const {
-  // Reserve the payload of one transaction, and a quarter more for what pages hold in addition to
-  // payloads. The next transaction then fills free pages, and the file does not grow.
+  // Keep space free for the payload of one transaction, and a quarter more for what pages hold in
+  // addition to payloads. The next transaction then fills free pages, and the file does not grow.
   const std::uint64_t reserve = limits_.transactionBytes + limits_.transactionBytes / 4;
   return (pages_ - freePages_) * pageBytes_ + reserve + more > limits_.databaseBytes;
 }
@@ -130,7 +134,7 @@ SqliteCode Retention::deleteAged(double now, std::span<RecordKind* const> kinds,
     });
     if (code != SQLITE_OK) return code;
     if (!found) {
-      // Set the next time only when nothing remains to be deleted. Otherwise the next round
+      // Wait for kAgeInterval only if nothing remains to be deleted. Otherwise the next call
       // continues at once.
       nextByAge_ = std::chrono::steady_clock::now() + kAgeInterval;
       return SQLITE_OK;
@@ -141,14 +145,14 @@ SqliteCode Retention::deleteAged(double now, std::span<RecordKind* const> kinds,
 }
 
 SqliteCode Retention::deleteForSize(std::span<RecordKind* const> kinds, bool& more) {
-  // Delete for several transactions at once. A deletion writes pages of tables and of the list of
-  // free pages; deletions of neighbouring blocks write the same ones.
+  // Delete enough for several transactions at once. A deletion writes pages of tables and of the
+  // list of free pages, and deletions of neighbouring blocks write the same pages.
   const std::uint64_t ahead = std::min(limits_.databaseBytes / kShareAhead, kMostAhead);
   SqliteCode code = readUse();
   if (code != SQLITE_OK || !isFull()) return code;
   for (int step = 0; step < kSizeSteps; ++step) {
     code = readUse();
-    // Measure again after each step: the records that it deletes may be large or small.
+    // Measure again after each step, because the deleted records may be large or small.
     if (code != SQLITE_OK || !isFull(ahead)) return code;
     bool found = false;
     code = deleteOldest(kinds, found);

@@ -9,11 +9,11 @@
 
 namespace halvox::platform::linux_ {
 
-// Keeps the store within its limits of age and size: deletes the oldest records of all kinds, in
-// small transactions between those that store records.
+// Keeps the store within its limits of age and size. Deletes the oldest records of all kinds, in
+// small transactions between the transactions that store records.
 // Owned by the store and used by the writer's thread only. Has no timer, because an idle service
-// must cause no wake-ups: the writer calls it at the start and after commits. Expired records of a
-// service that receives nothing therefore stay until the next record is written.
+// must cause no wake-ups. Instead, the writer calls it at the start and after commits. Expired
+// records of a service that receives nothing therefore stay until the next record is written.
 class Retention {
  public:
   struct Limits {
@@ -28,15 +28,15 @@ class Retention {
   // Finalizes all statements, before each closing of the database.
   void release();
 
-  // Runs one step in a transaction of its own. `now` is seconds since 1970. Sets `more` when
-  // another call has work to do. On an error the step is rolled back.
+  // Runs one step in a transaction of its own. `now` is seconds since 1970. Sets `more` to whether
+  // another call would find work. Rolls the step back after an error.
   [[nodiscard]] SqliteCode runOnce(double now, std::span<RecordKind* const> kinds, bool& more);
 
  private:
   using Time = std::chrono::steady_clock::time_point;
 
   [[nodiscard]] SqliteCode readUse();
-  // Returns true when another transaction and `more` bytes could make the file outgrow its limit.
+  // Returns true if one more transaction and `more` bytes could make the file outgrow its limit.
   [[nodiscard]] bool isFull(std::uint64_t more = 0) const;
   [[nodiscard]] std::uint64_t fileBytes() const { return pages_ * pageBytes_; }
   [[nodiscard]] SqliteCode deleteAged(double now, std::span<RecordKind* const> kinds, bool& more);

@@ -21,11 +21,11 @@ class SimpleRecordKind : public SpannedRecordKind {
   [[nodiscard]] bool hasTaken() const final { return next_ < taken_; }
 
  protected:
-  // The parameter of the record's first own column in the INSERT. Parameter 1 is the ID, and 2 is
-  // the time.
+  // The INSERT parameter of the first column in RecordTable::columns. Parameter 1 is the ID,
+  // parameter 2 the time.
   static constexpr int kFirstColumn = 3;
 
-  // What was bound to the INSERT.
+  // Facts about the record that was bound to the INSERT.
   struct Bound {
     double time;
     std::size_t bytes;  // the length of the payload
@@ -35,9 +35,10 @@ class SimpleRecordKind : public SpannedRecordKind {
   SimpleRecordKind(const RecordTable& table, WriterQueue& queue, StatisticsService& statistics,
                    std::uint64_t longestPayload);
 
-  // Moves the queued records to the taken ones and returns their number.
+  // Moves all queued records to the list of taken records, and returns their number.
   virtual std::size_t takeRecords() = 0;
-  // Binds the columns of a taken record to the statement. They stay valid until the next call.
+  // Binds the columns of a taken record to the statement. The bound values stay valid until the
+  // next call.
   virtual Bound bindRecord(std::size_t index, Statement& statement, PayloadEncoder& encoder) = 0;
   // Frees all taken records.
   virtual void forgetRecords() = 0;
@@ -55,23 +56,23 @@ class SimpleRecordKind : public SpannedRecordKind {
   std::size_t next_ = 0;  // the first taken record that is not written yet
 };
 
-// One kind of record that is stored one to a row. `Record` has `table` (its RecordTable), `time`
-// (seconds since 1970) and `bind`, as StoreRecords.h describes.
+// One kind of record of which each has a row of its own. `Record` has the members `table` (its
+// RecordTable), `time` (seconds since 1970) and `bind`; see StoreRecords.h.
 template <typename Record>
 class SimpleRecords final : public SimpleRecordKind {
  public:
   SimpleRecords(WriterQueue& queue, StatisticsService& statistics, std::uint64_t longestPayload)
       : SimpleRecordKind(Record::table, queue, statistics, longestPayload) {}
 
-  // Any thread. Queues a record. Waits while the queue is full, but never for the disk itself.
-  // Returns false when the store is closed; then the record is dropped and counted.
+  // Any thread. Queues a record. Waits while the queue is full, but never for the disk itself. If
+  // the store is closed, drops and counts the record and returns false.
   bool add(Record record) {
     return addQueued([&] { queued_.push_back(std::move(record)); });
   }
 
  private:
-  // Memory for this many records is kept between rounds: as many as the queue's soft limit. Memory
-  // that a burst needed beyond that is freed.
+  // Between rounds, keep memory for this many records, which is the soft limit of the queue. Free
+  // the memory that a burst needed beyond that.
   static constexpr std::size_t kKeptRecords = 8192;
 
   std::size_t takeRecords() override {
@@ -80,7 +81,8 @@ class SimpleRecords final : public SimpleRecordKind {
     return taken_.size();
   }
   Bound bindRecord(std::size_t index, Statement& statement, PayloadEncoder& encoder) override {
-    // Frees the previous record, so that memory shrinks while a large batch is written.
+    // The assignment frees the previous record. Memory therefore shrinks while a large batch is
+    // written.
     bound_ = std::move(taken_[index]);
     return {bound_.time, bound_.bind(statement, kFirstColumn, encoder)};
   }

@@ -17,8 +17,8 @@ bool SpannedRecordKind::charge(TransactionAllowance& allowance, std::uint64_t re
   allowance.records -= static_cast<std::int64_t>(records);
   allowance.payloadBytes -= static_cast<std::int64_t>(payloadBytes);
   if (payloadBytes <= longestPayload_) return true;
-  // The records count as written although they are not stored: the queue must know that they no
-  // longer wait.
+  // Count the records as written although they are not stored, because the queue must learn that
+  // they no longer wait.
   tooLarge_ += records;
   return false;
 }

@@ -16,9 +16,9 @@
 
 namespace halvox::platform::linux_ {
 
-// What all kinds of records have in common: their numbers and spans, the length that a payload may
-// have, and the account of the open transaction. Threads, owner and failures are those of
-// RecordKind.
+// The part of SimpleRecords that concerns the numbers and spans of records, the length that a
+// payload may have, and the counts of the open transaction. Threads, owner and failures are those
+// of RecordKind.
 class SpannedRecordKind : public RecordKind {
  public:
   [[nodiscard]] SqliteCode write(TransactionAllowance& allowance) final;
@@ -33,7 +33,7 @@ class SpannedRecordKind : public RecordKind {
   }
 
  protected:
-  // The names are not copied: pass constants.
+  // Pass constants, because the names are not copied.
   struct Names {
     std::string_view records;  // the table of the records
     std::string_view spans;    // the table of their spans
@@ -48,19 +48,20 @@ class SpannedRecordKind : public RecordKind {
         longestPayload_(longestPayload),
         spans_(names.records, names.spans) {}
 
-  // Waits for room and runs `append`, which queues one record. Returns false when the store is
-  // closed; then the record is counted as dropped.
+  // Waits for room in the queue, then runs `append`, which queues one record. If the store is
+  // closed, counts the record as dropped and returns false.
   template <typename Append>
   bool addQueued(Append&& append) {
-    // Count before waiting for room, so that the counts include callers that wait.
+    // Count before add(), which may wait for room. The counts then include records whose callers
+    // wait.
     counters_.addReceived();
     const bool added = queue_.add(std::forward<Append>(append));
     if (!added) counters_.addDropped(DropReason::kClosed, 1);
     return added;
   }
 
-  // Adds records that share one payload to the account of the open transaction. Returns false if
-  // the payload is too long; then they are counted as dropped and must not be written.
+  // Adds records that share one payload to the counts of the open transaction. If the payload is
+  // too long, counts the records as dropped and returns false; they must then not be written.
   [[nodiscard]] bool charge(TransactionAllowance& allowance, std::uint64_t records,
                             std::size_t payloadBytes);
 
@@ -72,7 +73,7 @@ class SpannedRecordKind : public RecordKind {
   [[nodiscard]] virtual SqliteCode writeNext(TransactionAllowance& allowance) = 0;
   // Frees all taken records, after a failed transaction. Returns how many were not written.
   virtual std::uint64_t forgetTaken() = 0;
-  // Logs that a payload was longer than that many bytes.
+  // Logs that a record was dropped because its payload was longer than that many bytes.
   virtual void logTooLarge(std::uint64_t longestPayload) const = 0;
   void endTransaction(FinishedRecords& finished);
 

@@ -26,9 +26,8 @@ std::string_view Statement::bytes(int column) const {
 }
 
 SqliteCode Database::open(const std::string& file, DatabaseAccess access) {
-  // Without SQLITE_OPEN_CREATE: StoreFiles creates the file, with the mode that it must have.
-  // NOMUTEX: SQLite's own lock is not needed, because each connection belongs to one thread at a
-  // time.
+  // SQLITE_OPEN_CREATE is missing because StoreFiles creates the file, with the right mode. With
+  // NOMUTEX, SQLite does not lock the connection, which belongs to one thread at a time.
   const int mode =
       access == DatabaseAccess::kReadOnly ? SQLITE_OPEN_READONLY : SQLITE_OPEN_READWRITE;
   const SqliteCode code = sqlite3_open_v2(file.c_str(), handle_.out(),

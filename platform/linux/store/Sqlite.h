@@ -16,22 +16,23 @@ namespace halvox::platform::linux_ {
 // A result code of SQLite: SQLITE_OK (0), or a primary or extended error code.
 using SqliteCode = int;
 
-// One prepared statement, finalized when the object is destroyed. Used only on the thread of its
-// Database, and destroyed before the Database is closed. Errors are returned as codes;
-// Database::errorText() says more about the last one.
+// One prepared statement. The destructor finalizes it. Use it only on the thread of its Database,
+// and destroy it before the Database is closed. Errors are returned as codes; Database::errorText()
+// describes the last error.
 class Statement {
  public:
   Statement() = default;
 
-  // Parameter indices begin at 1. Texts and bytes are not copied: the caller keeps them alive until
-  // the statement has run.
+  // Parameter indices begin at 1. Texts and bytes are not copied. The caller must keep them alive
+  // until the statement has run.
   void bind(int index, std::int64_t number) { sqlite3_bind_int64(handle_.get(), index, number); }
   void bind(int index, double number) { sqlite3_bind_double(handle_.get(), index, number); }
   void bind(int index, std::string_view text) {
     sqlite3_bind_text64(handle_.get(), index, text.data(), text.size(), SQLITE_STATIC, SQLITE_UTF8);
   }
   void bind(int index, std::span<const std::byte> bytes) {
-    // SQLite stores NULL for a null pointer, even when the length is 0. An empty span may have one.
+    // For a null pointer, SQLite would store NULL instead of an empty blob, and an empty span may
+    // have a null pointer.
     const void* data = bytes.empty() ? "" : static_cast<const void*>(bytes.data());
     sqlite3_bind_blob64(handle_.get(), index, data, bytes.size(), SQLITE_STATIC);
   }
@@ -66,15 +67,15 @@ class Statement {
 
 enum class DatabaseAccess : std::uint8_t { kReadWrite, kReadOnly };
 
-// One connection to a database file, closed when the object is destroyed. One thread at a time may
-// use it: SQLite's own locking of connections is turned off. Calls block on the disk, and on locks
-// of other connections for as long as sqlite3_busy_timeout() allows.
+// One connection to a database file. The destructor closes it. Only one thread at a time may use a
+// connection, because SQLite's own locking of connections is disabled. Calls block on the disk, and
+// on locks of other connections for as long as sqlite3_busy_timeout() allows.
 class Database {
  public:
-  // Opens an existing file, named by a path or a "file:" URI, and never creates one. SQLite does
-  // not read the file before the first statement: a damaged file is noticed only then.
+  // Opens an existing file, named by a path or a "file:" URI; never creates a file. SQLite reads
+  // the file only when the first statement runs, and reports damage only then.
   [[nodiscard]] SqliteCode open(const std::string& file, DatabaseAccess access);
-  // Closes the connection. All its statements must have been destroyed before.
+  // Closes the connection. All its statements must be destroyed already.
   void close() { handle_.reset(); }
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(handle_); }
 
@@ -88,7 +89,7 @@ class Database {
   [[nodiscard]] std::string errorText() const;
   // The errno of the system call that caused the last error; 0 if none did.
   [[nodiscard]] int systemError() const { return sqlite3_system_errno(handle_.get()); }
-  // Whether the last call failed: errorText() says "not an error" otherwise.
+  // Returns true if the last call failed. If it did not, errorText() is "not an error".
   [[nodiscard]] bool hasError() const {
     const int code = sqlite3_errcode(handle_.get()) & 0xFF;
     return code != SQLITE_OK && code != SQLITE_ROW && code != SQLITE_DONE;

@@ -6,7 +6,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Records analytics events in the store: those whose names match StoreOptions::wantedEvents.
+// Records analytics events in the store. Only events whose names match StoreOptions::wantedEvents
+// are used.
 // Any thread may call. Does not own the store and the clock, which must outlive it. Failures of the
 // store are counted and logged there and never reach the caller.
 class SqliteAnalyticsService final : public AnalyticsService {
@@ -15,7 +16,7 @@ class SqliteAnalyticsService final : public AnalyticsService {
       : names_(store.eventNames()), records_(store.messages()), clock_(clock) {}
 
   [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override;
-  // Stamps the event with the time of the call. The builder runs later, on the writer's thread.
+  // Records the event with the time of the call. The builder runs later, on the writer's thread.
   void sendAnalyticsEventLazy(std::string eventName, AnalyticsPayloadBuilder builder) override;
 
  private:

@@ -14,7 +14,7 @@ class SqliteMetricService final : public MetricService {
   SqliteMetricService(SqliteStore& store, const ClockService& clock)
       : records_(store.issueMetrics()), clock_(clock) {}
 
-  // The message is encoded before this returns.
+  // Encodes the message before it returns.
   void postIssueMetric(std::uint32_t metricID, const ProtoBase& message) override;
 
  private:

@@ -14,10 +14,10 @@ namespace {
 
 constexpr UnitLog kLog{storeCategory, "SqliteStore"};
 
-// Bounds the time of a transaction, and with it the time until a record is visible to readers.
+// Bounds the duration of a transaction, and thereby the time until readers see a record.
 constexpr std::int64_t kRecordsPerTransaction = 4096;
-// How long records gather after a failure before the next attempt. A failing disk is then tried
-// four times a second, not once for each batch of a flood.
+// After a failure, records gather for this long before the next attempt. The store then tries a
+// failing disk four times a second, not once for each batch of a flood.
 constexpr std::chrono::milliseconds kRetryTime{250};
 
 DropReason reasonOf(SqliteCode code, int systemError) {
@@ -29,9 +29,8 @@ DropReason reasonOf(SqliteCode code, int systemError) {
   return DropReason::kInputOutput;
 }
 
-// Disables SQLite's count of the memory that it uses: counting takes a lock at each allocation, and
-// nothing here reads the count. SQLite accepts this setting only before its first use in the
-// process.
+// Disables SQLite's count of the memory that it uses. Counting takes a lock at each allocation, and
+// nothing reads the count. SQLite accepts this setting only before its first use in the process.
 void configureLibrary() {
   static const bool kDone = [] {
     sqlite3_config(SQLITE_CONFIG_MEMSTATUS, 0);
@@ -71,14 +70,15 @@ void SqliteStore::close() {
 
 void SqliteStore::run() {
   setUpThread("halvox-store");
-  // Records may have expired since the last run, and no new record may arrive for a long time.
+  // Run retention at the start. Records may have expired since the last run, and the next record,
+  // after which retention runs, may come only much later.
   maintainWhileIdle();
   const auto takeAll = [this] {
     for (RecordKind* const kind : kinds_) kind->takeQueued();
   };
   while (queue_.take(nextRound_, takeAll)) {
     nextRound_ = std::chrono::steady_clock::now() + queue_.limits().gatherTime;
-    // Replace a damaged database before writing the records, which then go into the new one.
+    // Replace a damaged database before writing. The records then go into the new database.
     if (const auto finding = check_.finding()) replaceDamaged(*finding);
     writeTaken();
     maintainWhileIdle();
@@ -92,8 +92,8 @@ void SqliteStore::writeTaken() {
     const SqliteCode code = writeTransaction();
     if (code != SQLITE_OK) return fail(code, "cannot store records");
     onStored();
-    // Do this after every transaction, and not only when the writer is idle: under a steady flood
-    // it never is, and the file must not outgrow its limit.
+    // Run retention after every transaction. Under a steady flood the writer is never idle, and the
+    // file must not outgrow its limit.
     static_cast<void>(maintainOnce());
   }
 }
@@ -102,11 +102,12 @@ bool SqliteStore::hasTaken() const {
   return std::ranges::any_of(kinds_, [](const RecordKind* kind) { return kind->hasTaken(); });
 }
 
-// Opens the database if it is not open, or if its path now leads to another file or to none:
-// records in a file without a name would be lost. Returns false after dropping the taken records.
+// Opens the database if it is not open. Also opens it again if its path now leads to another file
+// or to none, because records in a file that has lost its name would be lost. If the database
+// cannot be used, drops the taken records and returns false.
 bool SqliteStore::makeReady() {
-  // One stat() for each transaction is needed, because SQLite does not notice that its file has
-  // lost its name.
+  // Call stat() for each transaction, because SQLite does not notice that its file has lost its
+  // name.
   if (database_.isOpen() && files_.identity() == identity_) return logHasRoom();
   if (database_.isOpen()) {
     kLog.error(files_.database().c_str(),
@@ -138,13 +139,13 @@ bool SqliteStore::logHasRoom() {
 }
 
 Result<void, StoreError> SqliteStore::openDatabase() {
-  // An orderly close removes the log. A log that exists was left by a run that was killed, or that
-  // ended before it had checked the database. Look for it before opening the database, which makes
-  // a new log.
+  // An orderly close removes the write-ahead log. If there is a log, the last run was killed, or
+  // ended before it had checked the database. Look for the log before opening the database, because
+  // opening makes a new one.
   bool mustCheck = files_.logBytes() > 0;
   if (auto opened = openStoreDatabase(files_, sizes_, database_); !opened) return opened;
   SqliteCode code = useDatabase();
-  // Reading the newest records may already have found what the check would look for.
+  // useDatabase() reads the newest records and may find damage. The check is then not needed.
   if (meansDamage(code)) {
     mustCheck = false;
     if (auto begun = beginAnew(database_.errorText()); !begun) return std::move(begun).error();
@@ -163,7 +164,7 @@ SqliteCode SqliteStore::useDatabase() {
   return code == SQLITE_OK ? prepareStatements() : code;
 }
 
-// Why useDatabase() failed. Closes the database.
+// Returns why useDatabase() failed, and closes the database.
 Failure<StoreError> SqliteStore::cannotRead() {
   Failure<StoreError> failure{
       StoreError::kCannotOpen,
@@ -185,10 +186,11 @@ Result<std::string, StoreError> SqliteStore::beginAnew(const std::string& findin
   return newName;
 }
 
-// Begins a new database. Copies the records of this run, which are newer than `extent_`, into it.
-// Records of earlier runs remain only in the renamed file.
+// Begins a new database and copies the records of this run into it: those that are newer than
+// `extent_`. Records of earlier runs remain only in the renamed file.
 void SqliteStore::replaceDamaged(const std::string& finding) {
-  // Copy the extent, because useDatabase() below replaces it with that of the new database.
+  // Copy the extent of the damaged database, because useDatabase() replaces `extent_` with that of
+  // the new one.
   const StoreExtent extent = extent_;
   const auto newName = beginAnew(finding);
   if (!newName) return kLog.error("", newName.error().message);
@@ -199,13 +201,13 @@ void SqliteStore::replaceDamaged(const std::string& finding) {
     kLog.error("cannot copy all records that were stored since the start; the others are only in ",
                *newName, ": ", problem);
   }
-  // Call this after the copy, so that numbering continues after the copied records.
+  // Call useDatabase() after the copy. Numbering then continues after the copied records.
   if (useDatabase() != SQLITE_OK) kLog.error("", cannotRead().message);
 }
 
 SqliteCode SqliteStore::prepareStatements() {
-  // IMMEDIATE takes the lock for writing now. A file that another process has locked is then
-  // noticed before payloads are built and encoded.
+  // IMMEDIATE takes the lock for writing at once. If another process has locked the file, the
+  // statement fails before payloads are built and encoded.
   SqliteCode code = database_.prepare("BEGIN IMMEDIATE", begin_);
   if (code == SQLITE_OK) code = database_.prepare("COMMIT", commit_);
   if (code == SQLITE_OK) code = retention_.prepare(database_);
@@ -237,8 +239,9 @@ void SqliteStore::onStored() {
 }
 
 void SqliteStore::fail(SqliteCode code, std::string_view what) {
-  // Read the errors first: every other call replaces them. After a failed commit SQLite does not
-  // return the system's error. In that case take errno, which writeTransaction() cleared.
+  // Read the errors first, because every other call replaces them. After a failed commit SQLite
+  // does not return the system's error. Use errno in that case; writeTransaction() has set it to 0
+  // before.
   const int lastError = errno;
   const int systemError = database_.systemError() != 0 ? database_.systemError() : lastError;
   const DropReason reason = reasonOf(code, systemError);
@@ -249,15 +252,16 @@ void SqliteStore::fail(SqliteCode code, std::string_view what) {
     static_cast<void>(database_.execute("ROLLBACK"));
   }
   drop(reason, description);
-  // After a lock or a full disk the connection remains usable. After any other error open it again.
+  // After a locked file or a full disk the connection is still usable. After any other error, close
+  // it; makeReady() opens it again.
   if (reason == DropReason::kLocked || reason == DropReason::kDiskFull) return;
   if (reason == DropReason::kDamaged) return replaceDamaged(description);
   abandonDatabase();
 }
 
 void SqliteStore::drop(DropReason reason, std::string_view what) {
-  // The time spent on a locked file must not count as slow writing: the queue would lower its
-  // limits and make callers wait.
+  // The time spent on a failure, such as a locked file, must not count as slow writing. The queue
+  // would lower its limits and make callers wait.
   queue_.disregardTime();
   FinishedRecords finished;
   for (RecordKind* const kind : kinds_) droppedSinceStored_ += kind->dropTaken(reason, finished);
@@ -289,16 +293,17 @@ void SqliteStore::closeDatabase() {
   const bool isChecked = check_.stop();
   releaseStatements();
   if (!database_.isOpen()) return;
-  // sqlite3_close() also copies the log, but only when no other connection is open.
+  // Copy the log into the database now. sqlite3_close() does so only if no other connection is
+  // open.
   sqlite3_wal_checkpoint_v2(database_.get(), nullptr, SQLITE_CHECKPOINT_PASSIVE, nullptr, nullptr);
-  // Keep the log: it shows the next run that it must check the database.
+  // Keep the log. It shows the next run that the database must be checked.
   if (!isChecked) return abandon(database_);
   database_.close();
 }
 
 void SqliteStore::abandonDatabase() {
-  // The caller may rename the file that the check reads. The log stays, so that an unfinished check
-  // is repeated.
+  // Stop the check, because the caller may rename the file that the check reads. The log stays; if
+  // the same file is opened again, its check is repeated.
   static_cast<void>(check_.stop());
   releaseStatements();
   abandon(database_);

@@ -40,18 +40,19 @@ struct StoreOptions {
 //
 //   made --open()--> running --close()--> closed
 //
-// Any thread adds records to the kinds below. One thread writes: SQLite allows one writer at a
-// time, and each commit has a fixed cost that a batch shares. The writer commits everything that
-// has arrived since its last commit, and starts at once if it was idle. A record is in the database
-// within half a second after the call that added it, unless the store dropped it; killing the
-// process later cannot lose it. A power cut can lose what the last checkpoint of the log had not
-// synced.
+// Any thread may add records to the kinds below. Only one thread writes, because SQLite allows one
+// writer at a time, and because a batch of records shares the fixed cost of a commit. The writer
+// commits everything that has arrived since its last commit, and starts at once if it was idle. A
+// record is in the database within half a second after the call that added it, unless the store
+// dropped it. Killing the process after that cannot lose the record. A power cut can lose what the
+// last checkpoint of the log had not synced.
 //
 // Failures never reach the callers. When the disk is full, the file is locked, or reading or
 // writing fails, the store drops and counts the records being written, logs at most one error a
-// second, and tries again with the next records. It creates a file that was deleted. It renames a
-// damaged database, starts a new one, and copies the records of this run into it. A database that
-// the last run did not close is checked in the background.
+// second, and tries again with the next records. If the file was deleted, the store creates a new
+// one. If the database is damaged, the store renames it, starts a new one, and copies the records
+// of this run into that. StoreCheck checks a database that the last run did not close, in the
+// background.
 //
 // Owned by the platform. open() and close() belong to one thread.
 class SqliteStore {
@@ -82,9 +83,10 @@ class SqliteStore {
   [[nodiscard]] LinkMessageRecords& linkMessages() { return linkMessages_; }
   [[nodiscard]] SnapshotRecords& snapshots() { return snapshots_; }
   [[nodiscard]] const ClockService& clock() const { return clock_; }
-  // The number of records that wait to be stored. Any thread may call.
+  // Returns the number of records that wait to be stored. Any thread may call.
   [[nodiscard]] std::uint64_t waiting() { return queue_.waiting(); }
-  // True while many records wait: callers that add one may soon have to wait. Any thread may call.
+  // Returns true while many records wait. A caller that adds a record may then have to wait. Any
+  // thread may call.
   [[nodiscard]] bool isBehind() const { return queue_.isBehind(); }
 
  private:

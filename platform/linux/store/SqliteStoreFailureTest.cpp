@@ -8,7 +8,8 @@
 #include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/testing/FileSizeLimit.h"
 
-// What the store does when something happens to its file while it runs.
+// Tests what the store does if its file is locked, removed, damaged or cannot grow while the store
+// runs.
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -42,7 +43,7 @@ class SqliteStoreFailureTest : public StoreFixture {
         {.time = now, .party = std::make_shared<LinkParty>(), .payload = payload});
     store->snapshots().add({.time = now, .signature = payload, .path = "/s"});
   }
-  // Stores one event and begins a transaction that reads it and does not end.
+  // Stores one event, and begins a transaction that reads the event and does not end.
   void holdOneEvent(Database& reader) {
     send(1);
     ASSERT_TRUE(allIsStored());
@@ -221,7 +222,7 @@ TEST_F(SqliteStoreFailureTest, SetsAsideAFileThatIsDestroyedWhileItRunsAndContin
   for (int number = 0; number < 10'000; ++number) sendLong();
   ASSERT_TRUE(allIsStored());
   // Overwrite the database and its log in place, as a failing disk or a stray program would. Open
-  // both first: the store may set them aside as soon as one of them is destroyed.
+  // both files first, because the store may rename them as soon as one of them is damaged.
   using File = std::unique_ptr<std::FILE, int (*)(std::FILE*)>;
   std::vector<std::pair<File, std::size_t>> files;
   for (const char* suffix : {"", "-wal"}) {

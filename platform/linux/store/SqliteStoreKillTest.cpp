@@ -9,7 +9,7 @@
 
 #include "platform/linux/store/StoreFixture.h"
 
-// What remains of a store whose process was killed under load.
+// Tests what remains of a store whose process was killed under load.
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -19,7 +19,7 @@ using ::testing::ElementsAre;
 using Clock = std::chrono::steady_clock;
 constexpr std::size_t kMostEvents = 4'000'000;
 
-// Shared memory: the process that will be killed writes it, the test reads it.
+// Shared memory. The process that will be killed writes to it, and the test reads it.
 struct Progress {
   std::atomic<std::size_t> sent;
   Clock::time_point times[kMostEvents];  // when each send() returned
@@ -44,8 +44,8 @@ class SqliteStoreKillTest : public StoreFixture {
     ::_exit(2);
   }
 
-  // Kills a sending process when it has sent for `time`. Returns how many of its events were
-  // older than half a second at that moment.
+  // Starts a process that sends events, and kills it after `time`. Returns how many of its events
+  // were older than half a second at that moment.
   std::size_t killAfter(std::chrono::milliseconds time) {
     progress_->sent = 0;
     const pid_t child = ::fork();

@@ -53,7 +53,7 @@ TEST_F(SqliteStoreTest, StoresThePayloadOfTheTwoEventsOfAMessageOnce) {
               ElementsAre("com.tarno.halvox.Session.Start|{\"number\":7}",
                           "com.tarno.haptics.Session.Start|{\"number\":7}",
                           "com.tarno.halvox.Session.Stop|{\"number\":8}"));
-  // The whole texts of the second one are only in its reference to the first.
+  // The block has the text of the equal payloads only once. The second event refers to the first.
   const auto blocks = rows(database(), "SELECT block FROM message_blocks");
   EXPECT_THAT(blocks, Each(Not(ContainsRegex("number.*7.*number.*7"))));
 }
@@ -134,7 +134,8 @@ TEST_F(SqliteStoreTest, AnEventIsInTheDatabaseWithinHalfASecondWhileTheStoreRuns
     delays.push_back(std::chrono::steady_clock::now() - sent);
   }
 
-  // A store that gathers for too long delays all records; a busy machine delays only some.
+  // Compare the median. A store that gathers records for too long delays all of them, whereas a
+  // busy machine delays only some.
   std::ranges::sort(delays);
   EXPECT_LT(delays[delays.size() / 2], std::chrono::milliseconds(500));
 }

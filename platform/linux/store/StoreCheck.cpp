@@ -23,8 +23,9 @@ constexpr UnitLog kLog{storeCategory, "StoreCheck"};
 
 using Clock = std::chrono::steady_clock;
 
-// Short enough to delay the writer's checkpoints no longer than a commit takes on a slow disk. Long
-// enough to read a few megabytes from a fast disk.
+// How long one slice of the check reads. The time is short enough to delay the writer's checkpoints
+// no longer than a commit takes on a slow disk, and long enough to read a few megabytes from a fast
+// disk.
 constexpr std::chrono::milliseconds kSlice{20};
 constexpr std::chrono::milliseconds kShortestPause{1};
 constexpr std::chrono::milliseconds kBusyTimeout{250};
@@ -32,8 +33,9 @@ constexpr std::chrono::milliseconds kBusyTimeout{250};
 constexpr const char* kNotCheckedNow = "; it is not checked before the next start";
 
 // Lowers the priority of this thread for the processor and for the disk. The scheduler's idle class
-// would be too low: on a busy machine a slice would not end for minutes, and the log would grow
-// meanwhile. Lowering needs no privilege. If the kernel refuses, the pauses alone limit the load.
+// would be too low: on a busy machine a slice would not end for minutes, and the write-ahead log
+// would grow in that time. Lowering the priority needs no privilege. If the kernel refuses it, only
+// the pauses limit the load.
 void giveWayToOthers() {
   constexpr int kNice = 10;
   static_cast<void>(::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), kNice));
@@ -41,23 +43,23 @@ void giveWayToOthers() {
       ::syscall(SYS_ioprio_set, IOPRIO_WHO_PROCESS, 0, IOPRIO_PRIO_VALUE(IOPRIO_CLASS_IDLE, 0)));
 }
 
-// Unpacks a block, whose checksum shows damage that SQLite does not see. Columns 2 and 5 are
-// `records` and `block`.
+// Unpacks a block. Its checksum shows damage that SQLite does not see. Columns 2 and 5 of the row
+// are `records` and `block`.
 bool isSound(const Statement& row, MessageBlockReader& reader, std::uint64_t& count) {
   reader.open(row.bytes(5), row.integer(2));
   while (reader.next()) ++count;
   return !reader.isDamaged();
 }
 
-// Reads rows until the time of the slice is over. Returns SQLITE_ROW if there may be more,
-// SQLITE_DONE after the last row, or an error. Stepping also loads the overflow pages of long
-// payloads.
+// Reads rows until the time of the slice is over. Returns SQLITE_ROW if there may be more rows,
+// SQLITE_DONE after the last row, or an error. A step also loads the overflow pages of a long
+// payload.
 SqliteCode readSlice(Statement& rows, std::int64_t& last, std::uint64_t& count,
                      MessageBlockReader* blocks) {
   const auto end = Clock::now() + kSlice;
   SqliteCode code = SQLITE_ROW;
   while ((code = rows.step()) == SQLITE_ROW) {
-    // Numbers must grow. In a damaged table they may not, and the check would never end.
+    // Row numbers must grow. In a damaged table they may not grow, and the check would never end.
     if (rows.integer(0) <= last) return SQLITE_CORRUPT;
     last = rows.integer(0);
     if (blocks == nullptr) {
@@ -73,7 +75,8 @@ SqliteCode readSlice(Statement& rows, std::int64_t& last, std::uint64_t& count,
 }  // namespace
 
 void StoreCheck::begin(const std::string& file, const StoreExtent& extent, OnDamage onDamage) {
-  // A check of a database that was opened before must not report about this one.
+  // Stop the check of an earlier database. Its finding must not be taken for one about this
+  // database.
   static_cast<void>(stop());
   records_ = 0;
   isChecked_ = false;
@@ -113,7 +116,8 @@ void StoreCheck::run(const std::string& file, const StoreExtent& extent, const O
   std::string what;
   Outcome outcome = Outcome::kUnreadable;
   if (database.open(file, DatabaseAccess::kReadOnly) == SQLITE_OK) {
-    // The writer may hold a lock for a moment. Damage and a lock must not be confused.
+    // Wait for locks, which the writer may hold for a moment. A locked file must not be taken for a
+    // damaged one.
     sqlite3_busy_timeout(database.get(), static_cast<int>(kBusyTimeout.count()));
     outcome = readAll(database, extent, what);
   } else {
@@ -141,8 +145,8 @@ void StoreCheck::run(const std::string& file, const StoreExtent& extent, const O
 
 StoreCheck::Outcome StoreCheck::readAll(Database& database, const StoreExtent& extent,
                                         std::string& what) {
-  // The table of names is the only one with an index, and reading rows does not read an index. One
-  // slice is enough, because there are few names.
+  // event_names is the only table with an index, which reading its rows would not check. One
+  // statement is enough for the whole table, because there are few names.
   Statement names;
   SqliteCode code = database.prepare("PRAGMA quick_check(event_names)", names);
   if (code == SQLITE_OK) code = names.step();
@@ -181,8 +185,8 @@ StoreCheck::Outcome StoreCheck::readTable(Database& database, const std::string&
   std::int64_t last = std::numeric_limits<std::int64_t>::min();
   while (code == SQLITE_ROW) {
     const auto begun = Clock::now();
-    // Each slice is a new query that continues after the last row. The transaction of the previous
-    // slice has ended, and retention may have deleted rows since.
+    // Each slice is a new query that continues after the last row. Retention may have deleted rows
+    // since the transaction of the previous slice has ended.
     rows.bind(1, last);
     rows.bind(2, newest);
     code = readSlice(rows, last, count, hasBlocks ? &blocks : nullptr);
@@ -199,8 +203,8 @@ StoreCheck::Outcome StoreCheck::readTable(Database& database, const std::string&
 }
 
 bool StoreCheck::pause(Clock::duration length) {
-  // Pause for as long as the slice took: on a busy disk, the check uses at most half of the disk's
-  // time.
+  // Pause for as long as the slice took. Even on a slow disk, the check then uses at most half of
+  // the disk's time.
   const auto until = Clock::now() + std::max<Clock::duration>(length, kShortestPause);
   const MutexLock lock(mutex_);
   while (!isStopping_ && stopping_.waitUntil(mutex_, until)) {

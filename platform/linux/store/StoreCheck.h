@@ -18,21 +18,21 @@ namespace halvox::platform::linux_ {
 //                        |
 //                        +--stop()--> stopped
 //
-// A killed service leaves its database sound. A failing disk, a power cut or another program may
-// damage it. Reading a large database takes minutes on a cold disk. A thread of its own, with low
-// priority, therefore reads it in slices. Each slice ends its transaction, because an open one
-// would keep the writer from reusing the write-ahead log. After each slice the thread pauses for
-// the same time.
+// A killed service leaves its database sound, but a failing disk, a power cut or another program
+// may have damaged it. Reading a large database takes minutes if it is not in the page cache. A
+// thread of its own, with low priority, therefore reads the database in slices. Each slice ends its
+// transaction, because an open transaction would keep the writer from reusing the write-ahead log.
+// After each slice the thread pauses for as long as the slice took.
 //
-// Reads only the records that existed when the database was opened: this run has written the later
-// ones. Reports only damage. If the file cannot be read for another reason, logs an error and gives
-// up: the store notices such an error itself when it needs the page. The store repeats an
-// unfinished check when it opens the database the next time.
+// Reads only the records that existed when the database was opened, because this run has written
+// the later ones. Reports only damage. If the file cannot be read for another reason, logs an error
+// and gives up, because the store notices such an error itself when it needs the page. The store
+// repeats an unfinished check when it opens the database the next time.
 //
 // Owned by the store. Only the store's own threads call begin() and stop(), one at a time.
 class StoreCheck {
  public:
-  // Called at most once, on the thread of the check, after finding() has its value. Must not call
+  // Called at most once, on the thread of the check, when finding() has a value. Must not call
   // stop(), which waits for that thread.
   using OnDamage = std::function<void()>;
 
@@ -44,10 +44,10 @@ class StoreCheck {
   // Stops a running check and starts to check `file`. If no thread can be started, logs an error
   // and gives up.
   void begin(const std::string& file, const StoreExtent& extent, OnDamage onDamage);
-  // Ends the thread and forgets its finding. Blocks for at most one slice. Returns false if the
-  // check was not finished and must be repeated. Further calls do nothing and return true.
+  // Ends the thread and clears finding(). Blocks for at most one slice. Returns false if the check
+  // was not finished and must be repeated. Further calls do nothing and return true.
   bool stop();
-  // Any thread. Describes the damage; std::nullopt while none was found.
+  // Any thread. Returns a description of the damage; std::nullopt while none was found.
   [[nodiscard]] std::optional<std::string> finding() HALVOX_EXCLUDES(mutex_);
 
  private:
@@ -61,7 +61,7 @@ class StoreCheck {
   [[nodiscard]] bool pause(std::chrono::steady_clock::duration length) HALVOX_EXCLUDES(mutex_);
 
   std::thread thread_;
-  // Used by the thread, and by other threads after it has ended.
+  // Used by the thread of the check, and by other threads only after that thread has ended.
   std::uint64_t records_ = 0;  // read so far
   bool isChecked_ = true;      // nothing is left to check
   Mutex mutex_;

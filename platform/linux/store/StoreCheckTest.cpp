@@ -7,7 +7,7 @@
 #include "platform/linux/store/StoreFixture.h"
 #include "platform/linux/testing/NoThreadsToHave.h"
 
-// What the store does with a database that the last run did not close.
+// Tests what the store does with a database that the last run did not close.
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -57,13 +57,13 @@ class StoreCheckTest : public StoreFixture {
   void damageBlock() {
     const std::string block = rows(database(), "SELECT block FROM message_blocks LIMIT 1").front();
     std::string content = readFile(database());
-    // The middle of a long block is on pages that hold nothing else.
+    // Change the middle of a long block, because it is on pages that hold nothing else.
     const std::size_t at = content.find(block.substr(block.size() / 2, 64));
     ASSERT_NE(at, std::string::npos);
     content.replace(at, 4, "\xA5\xA5\xA5\xA5");
     writeFile(database(), content);
   }
-  // These functions wait for a long time, because the check has a low priority and is slow on a
+  // These functions have long time limits, because the check has a low priority and is slow on a
   // busy machine.
   bool eventuallySetAside() {
     return patiently([this] { return !setAsideFiles().empty(); });
@@ -77,8 +77,9 @@ class StoreCheckTest : public StoreFixture {
   }
 
  private:
-  // A checkpoint copies nothing while the writer makes one of its own. Damage to the database would
-  // then have no effect, because the log still has all pages.
+  // Copies the log into the database. Returns true if all pages were copied. The pages that stay in
+  // the log would hide damage to the database file, and a checkpoint copies nothing while the
+  // writer makes one of its own.
   [[nodiscard]] bool isLogCopied() const {
     Database connection;
     Statement checkpoint;
@@ -262,7 +263,7 @@ TEST_F(StoreCheckTest, StartsWithANewDatabaseWhenTheNewestRecordsCannotBeRead) {
 }
 
 TEST_F(StoreCheckTest, FindsADamagedTableOfNames) {
-  // The names that the events of an earlier version refer to.
+  // Adds the names to which the events of an earlier version refer.
   start();
   stop();
   execute(database(), "INSERT INTO event_names VALUES (1, 'com.tarno.old')");

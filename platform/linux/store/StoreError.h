@@ -4,8 +4,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Why a store could not be opened or read. The message of the failure is a line for the user that
-// names the file and the reason.
+// Why a store could not be opened or read. The message of the failure is one line for the user,
+// with the file and the reason.
 enum class StoreError : std::uint8_t {
   kDirectory,     // the directory or a file in it cannot be created or written to
   kInUse,         // another service writes to this store

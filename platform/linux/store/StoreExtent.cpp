@@ -3,7 +3,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Attaches a second file to a connection, under the name `damaged`, while this object lives.
+// While this object exists, a second file is attached to the connection under the name `damaged`.
 class AttachedFile {
  public:
   AttachedFile(Database& database, const std::string& file) : database_(database) {
@@ -25,7 +25,7 @@ class AttachedFile {
   SqliteCode code_ = SQLITE_OK;
 };
 
-// Copies one kind in one transaction, so that its records and spans agree after any failure.
+// Copies one kind in one transaction. Its records and spans therefore agree even after a failure.
 SqliteCode copyKind(const KindTables& tables, std::int64_t newest, Database& database) {
   const std::string records(tables.records);
   const std::string spans(tables.spans);
@@ -34,8 +34,9 @@ SqliteCode copyKind(const KindTables& tables, std::int64_t newest, Database& dat
       "INSERT INTO main." +
       records + " SELECT * FROM damaged." + records + " WHERE id > " + std::to_string(newest) +
       ";"
-      // The first of these spans may also cover records that are not copied. A span may cover more
-      // time than its records: readers use it only to skip records.
+      // The first of these spans may also cover records that are not copied. It may therefore cover
+      // more time than the copied records, which is harmless: readers use spans only to skip
+      // records.
       "INSERT INTO main." +
       spans + " SELECT * FROM damaged." + spans +
       " WHERE span >= " + std::to_string((newest + 1) / tables.recordsPerSpan) +

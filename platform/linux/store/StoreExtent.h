@@ -30,9 +30,9 @@ inline constexpr std::array<KindTables, 6> kKindTables{{
     {"message_blocks", "message_spans", 1, "id + records - 1", "ifnull(sum(records), 0)"},
 }};
 
-// The number of the newest record of each kind, in the order of kKindTables; 0 if there is none. A
-// store takes it when it opens its database. It separates the records of earlier runs from those of
-// this run, because record numbers only grow. A plain value.
+// The number of the newest record of each kind, in the order of kKindTables; 0 if there is none.
+// The store reads these numbers when it opens its database. Because record numbers only grow, they
+// separate the records of earlier runs from those of this run. A plain value.
 struct StoreExtent {
   std::array<std::int64_t, kKindTables.size()> newest{};
 

@@ -11,7 +11,8 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::HasSubstr;
 
-// A fixture with a database of 1,000 events. The extent was taken after the first 600.
+// A fixture with a database of 1,000 events, and the extent that the database had after the first
+// 600.
 class StoreExtentTest : public StoreFixture {
  protected:
   StoreExtentTest() {

@@ -16,12 +16,13 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::string_view kLockFileName = "halvox.lock";
-// The database, its write-ahead log and the index of the log. They are renamed together: SQLite
-// would copy a log into whatever database has its name.
+// The database, its write-ahead log and the index of the log. They are renamed together, because
+// SQLite would copy a log that stays into the new database of the same name.
 constexpr std::array<std::string_view, 3> kSuffixes{"", "-wal", "-shm"};
 constexpr mode_t kFileMode = 0640;
-// The time in a name has a resolution of one second; a number distinguishes equal times. This bound
-// ends the search in a directory full of such files. The rename then replaces the last one tried.
+// The time in the name of a damaged database has a resolution of one second. If the name exists, a
+// number is added to it. This bound ends the search for a free number in a directory full of such
+// files; the rename then replaces the file with the last number.
 constexpr int kMostNamesTried = 100;
 
 Failure<StoreError> failure(StoreError code, const std::filesystem::path& path,
@@ -67,7 +68,8 @@ StoreFiles::StoreFiles(const std::filesystem::path& directory)
 
 Result<void, StoreError> StoreFiles::claimDirectory() {
   struct stat status {};
-  // The lock is useless once its file was removed: another service would create and lock a new one.
+  // Take the lock again if its file was removed, because another service would create and lock a
+  // new file.
   if (lock_ && ::fstat(lock_.get(), &status) == 0 && status.st_nlink > 0) return {};
   std::error_code error;
   std::filesystem::create_directories(directory_, error);
@@ -93,12 +95,12 @@ Result<void, StoreError> StoreFiles::claimDirectory() {
 }
 
 Result<void, StoreError> StoreFiles::makeDatabaseFile() {
-  // The log of a database that was removed must not be applied to the new one.
+  // Rename the log of a database that was removed. SQLite must not apply it to the new database.
   if (sizeOf(database_) == 0 && logBytes() > 0) {
     if (auto log = setAside(); !log) return std::move(log).error();
   }
-  // SQLite would make the database readable for all users. It gives the log the mode of the
-  // database.
+  // Create the file here, because SQLite would make it readable for all users. SQLite gives the log
+  // the same mode as the database.
   const UniqueFd made(::open(database_.c_str(), O_RDWR | O_CREAT | O_EXCL | O_CLOEXEC, kFileMode));
   if (made || errno == EEXIST) return {};
   return failure(StoreError::kDirectory, database_, "cannot create the database file", errno);

@@ -13,7 +13,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Identifies the file that a path led to, to notice later that the path leads to another file.
+// Identifies the file to which a path leads. Comparing two identities shows whether the path leads
+// to another file now.
 struct FileIdentity {
   dev_t device = 0;
   ino_t inode = 0;
@@ -21,8 +22,8 @@ struct FileIdentity {
 };
 
 // The files of one store in its directory: the lock, the database and its write-ahead log.
-// Owned by the store or a reader, and used by one thread at a time: in the service by the thread
-// that opens the store, then by the writer. Calls block on the disk.
+// Owned by the store or by a reader. Only one thread at a time uses it; in the service, first the
+// thread that opens the store, then the writer. Calls block on the disk.
 class StoreFiles {
  public:
   explicit StoreFiles(const std::filesystem::path& directory);
@@ -32,17 +33,18 @@ class StoreFiles {
   // takes the lock again if the lock file was removed. Fails with kDirectory, kInUse or
   // kCannotOpen.
   Result<void, StoreError> claimDirectory();
-  // Creates an empty database file, readable by owner and group, unless one exists. First renames
-  // a write-ahead log that has no database: SQLite deletes such a log when it opens an empty file.
+  // Creates an empty database file, readable by owner and group, unless one exists. First renames a
+  // write-ahead log without a database, because SQLite would delete such a log when it opens the
+  // empty file.
   Result<void, StoreError> makeDatabaseFile();
   // Renames the database, its log and its index to halvox.db.damaged-<UTC time> and returns the
   // new path. Nothing is deleted. The database must not be open in this process.
   Result<std::string, StoreError> setAside();
 
   [[nodiscard]] const std::filesystem::path& database() const { return database_; }
-  // The file that the database's path leads to now; std::nullopt when there is none.
+  // Returns the file to which the database's path leads now; std::nullopt if there is none.
   [[nodiscard]] std::optional<FileIdentity> identity() const;
-  // The size of the write-ahead log; 0 when there is none.
+  // Returns the size of the write-ahead log; 0 if there is none.
   [[nodiscard]] std::uint64_t logBytes() const;
 
  private:
@@ -51,7 +53,7 @@ class StoreFiles {
   UniqueFd lock_;
 };
 
-// The file that a path leads to now; std::nullopt when there is none.
+// Returns the file to which a path leads now; std::nullopt if there is none.
 [[nodiscard]] std::optional<FileIdentity> fileIdentity(const std::filesystem::path& path);
 
 }  // namespace halvox::platform::linux_

@@ -40,7 +40,7 @@ class StoreFixture : public ::testing::Test {
     const auto opened = open();
     ASSERT_TRUE(opened) << "cannot open the store: " << opened.error().message;
   }
-  // Writes what waits and closes the store.
+  // Closes the store, which first writes the waiting records.
   void stop() { store.reset(); }
 
   // Sends an event whose payload is {"number": number}.
@@ -67,7 +67,8 @@ class StoreFixture : public ::testing::Test {
 
 // The payload of send(number).
 [[nodiscard]] std::string numbered(std::int64_t number);
-// A text of that length which compresses by no more than a quarter. Each number gives another.
+// Returns a text of that length that compression shortens by at most a quarter. Each number gives a
+// different text.
 [[nodiscard]] std::string noise(std::uint64_t number, std::size_t length);
 
 }  // namespace halvox::platform::linux_

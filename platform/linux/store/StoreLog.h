@@ -13,11 +13,10 @@ inline LogCategory& storeCategory() {
   return category;
 }
 
-// For a log line that every record could cause: lets at most one line a second pass. Belongs to one
-// thread.
+// Limits a log line that every record could cause to one line a second. Belongs to one thread.
 class OncePerSecond {
  public:
-  // Returns true when the line may be logged now, which begins the next second of silence.
+  // Returns true if the line may be logged now. For one second after that, returns false.
   [[nodiscard]] bool tryPass() {
     const auto now = std::chrono::steady_clock::now();
     if (now < next_) return false;

@@ -13,18 +13,18 @@ namespace {
 constexpr UnitLog kLog{storeCategory, "StoreOpening"};
 
 constexpr std::uint64_t kMegabyte = 1024U * 1024U;
-// A message costs 3.6 us of CPU with pages of 8,192 bytes and 4.3 us with 4,096: fewer pages are
-// written. With 16,384 bytes it costs 3.5 us, but the commit of a single message, which writes two
-// or three pages, becomes larger.
+// With pages of 8,192 bytes a message costs 3.6 us of CPU, because fewer pages are written than
+// with 4,096 bytes, where it costs 4.3 us. With 16,384 bytes it costs 3.5 us, but the commit of a
+// single message, which writes two or three pages, becomes larger.
 constexpr std::uint64_t kPageBytes = 8192;
 constexpr std::uint64_t kCacheKibibytes = 1024;
 constexpr std::uint64_t kLargestLog = 4 * kMegabyte;
-// A record becomes visible with the commit of its transaction. This bounds the time until then.
+// Readers see a record after the commit of its transaction. This size bounds the time until then.
 constexpr std::uint64_t kLargestTransaction = 2 * kMegabyte;
-// Must stay below the 1,000,000,000 bytes that SQLite accepts for one value.
+// Must be less than the 1,000,000,000 bytes that SQLite accepts for one value.
 constexpr std::uint64_t kLargestPayload = 256 * kMegabyte;
 // How long the writer waits for a lock of another process before it drops the records being
-// written. This is half of the half second within which a stored record must be visible.
+// written. This is half of the time (500 ms) within which readers must see a record.
 constexpr std::chrono::milliseconds kBusyTimeout{250};
 
 Failure<StoreError> failure(StoreError code, const StoreFiles& files, const std::string& what) {
@@ -37,10 +37,11 @@ Failure<StoreError> judged(SqliteCode code, const StoreFiles& files, const Datab
 }
 
 std::string pragmas(const StoreSizes& sizes) {
-  // The first two must precede the first table: for an existing file SQLite applies them only in a
-  // full VACUUM. Deleted records leave free pages that later records fill. The page map that
-  // incremental vacuum needs has no measurable cost and lets the file shrink after its limit was
-  // lowered. With WAL and NORMAL a kill loses nothing that was committed; only a power cut can.
+  // The first two settings must precede the first table, because for an existing file SQLite
+  // applies them only in a full VACUUM. Deleted records leave free pages, which later records fill.
+  // The page map that incremental vacuum needs has no measurable cost, and the file can shrink
+  // after its limit was lowered. With WAL and NORMAL, only a power cut can lose committed records;
+  // killing the process cannot.
   return "PRAGMA page_size = " + std::to_string(kPageBytes) +
          "; PRAGMA auto_vacuum = INCREMENTAL"
          "; PRAGMA journal_mode = WAL; PRAGMA synchronous = NORMAL"
@@ -48,18 +49,20 @@ std::string pragmas(const StoreSizes& sizes) {
          std::to_string(sizes.logBytes / kPageBytes) +
          "; PRAGMA journal_size_limit = " + std::to_string(sizes.logBytes) +
          "; PRAGMA cache_size = -" + std::to_string(kCacheKibibytes) +
-         // Debian builds SQLite with secure_delete on, which overwrites deleted records with zeros.
+         // Debian builds SQLite with secure_delete enabled, which would overwrite deleted records
+         // with zeros.
          "; PRAGMA secure_delete = OFF; PRAGMA temp_store = MEMORY";
 }
 
-// Opens the file without changing it: a database of a newer version must stay as it is.
+// Opens the file and reads its version without changing it, because a database of a newer version
+// must stay as it is.
 Result<void, StoreError> examine(const StoreFiles& files, Database& database) {
   SqliteCode code = database.open(files.database(), DatabaseAccess::kReadWrite);
   if (code != SQLITE_OK) return judged(code, files, database);
-  // Set the time-out before the first statement: another program may hold a lock while the service
-  // starts.
+  // Set the time-out before the first statement, because another program may hold a lock while the
+  // service starts.
   sqlite3_busy_timeout(database.get(), static_cast<int>(kBusyTimeout.count()));
-  // Reads the first page. This detects a file that is not a database before anything changes it.
+  // Read the first page. This detects a file that is not a database before anything changes it.
   code = database.execute("PRAGMA schema_version");
   if (code != SQLITE_OK) return judged(code, files, database);
   const auto version = database.queryInteger("PRAGMA user_version");
@@ -98,8 +101,8 @@ StoreSizes StoreSizes::of(std::uint32_t maxMegabytes) {
   const std::uint64_t all = std::max<std::uint64_t>(maxMegabytes, 1) * kMegabyte;
   const std::uint64_t log = std::min(kLargestLog, all / 8);
   const std::uint64_t transaction = std::min(kLargestTransaction, all / 8);
-  // The log exceeds its size by the transaction that fills it. SQLite writes whole pages, so that
-  // transaction can need more than its payloads: reserve twice their size.
+  // The log exceeds its size by the transaction that fills it. Reserve twice the size of that
+  // transaction's payloads, because SQLite writes whole pages.
   return {.databaseBytes = all - log - 2 * transaction,
           .logBytes = log,
           .transactionBytes = transaction,

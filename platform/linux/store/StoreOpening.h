@@ -9,7 +9,7 @@
 
 namespace halvox::platform::linux_ {
 
-// How large the parts of a store may become. All sizes derive from the one that the user set.
+// How large the parts of a store may become. All sizes derive from the size in the configuration.
 struct StoreSizes {
   std::uint64_t databaseBytes;     // above this size the oldest records are deleted
   std::uint64_t logBytes;          // at this size the write-ahead log is copied into the database
@@ -20,20 +20,20 @@ struct StoreSizes {
 };
 
 // Opens the store's database for writing. Creates the directory, the file and the tables that are
-// missing, and migrates an older schema. Reads only the first pages, however large the file is.
-// When they show damage, renames the database, logs an error and starts with an empty one. Leaves
-// a database of a newer version untouched and returns an error.
+// missing, and migrates an older schema. Reads only the first pages, however large the file is. If
+// they show damage, renames the database, logs an error and creates an empty one. If a newer
+// version made the database, leaves it unchanged and returns an error.
 //
 // Blocks on the disk, and up to 250 ms for each lock that another process holds. `files` and
 // `database` belong to the caller.
 Result<void, StoreError> openStoreDatabase(StoreFiles& files, const StoreSizes& sizes,
                                            Database& database);
 
-// Closes a database without copying its write-ahead log into it, so that damaged files stay as
-// they are and can be examined. Does nothing when the database is not open.
+// Closes a database without copying its write-ahead log into it. Damaged files therefore stay as
+// they are and can be examined. Does nothing if the database is not open.
 void abandon(Database& database);
 
-// Returns true when the code says that the content of the file is broken.
+// Returns true if the code means that the content of the file is damaged.
 [[nodiscard]] bool meansDamage(SqliteCode code);
 
 }  // namespace halvox::platform::linux_

@@ -11,9 +11,9 @@
 
 namespace halvox::platform::linux_ {
 
-// The records that are stored one to a row, as callers queue them: plain values. `time` is seconds
-// since 1970. Payloads wait as dictionaries; the writer encodes them, which keeps JSON off the
-// callers' threads.
+// The records that have a row each, as callers queue them. All are plain values. `time` is seconds
+// since 1970. Payloads wait as dictionaries, because the writer encodes them and the callers'
+// threads are spared that work.
 //
 // `bind` passes the columns of a record to the statement that inserts it, and returns the number of
 // bytes that count against the transaction. The record must outlive the statement's run.

@@ -21,7 +21,7 @@ using ::testing::SizeIs;
 constexpr double kNow = 1'700'000'000;
 constexpr double kDay = 86'400;
 
-// A metric with one field, encoded as the metric back-end encodes its messages.
+// A metric message with one field, in the encoding that the metric back-end uses.
 class OneField final : public ProtoBase {
  public:
   bool readFrom(ProtoReader& /*reader*/) override { return true; }

@@ -6,17 +6,17 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// A message makes two events with equal payloads. One record holds both, which halves the bytes
-// and the inserts; for a record of a single event the twin columns are NULL. Record numbers only
-// grow.
+// A message makes two events with equal payloads. One record holds both events, which halves the
+// bytes and the inserts. In the record of a single event the twin columns are NULL. Record numbers
+// only grow.
 //
-// The time has no index, which would raise SQLite's CPU time per message from 2.2 to 3.0 us.
-// analytics_spans holds the first and the last time of every 512 records instead. It is written
-// once for each transaction and once for every 512 records. Readers use it to find a range of time,
-// and retention to find expired records.
+// The time has no index, because an index would raise SQLite's CPU time per message from 2.2 to 3.0
+// us. Instead, analytics_spans holds the first and the last time of every 512 records. It is
+// written once for each transaction and once for every 512 records. Readers use it to find a range
+// of time, and retention to find expired records.
 //
-// The view uses CROSS JOIN because SQLite does not reorder the tables of such a join: its rows are
-// in the order in which the events were sent, without a sort.
+// The view uses CROSS JOIN because SQLite does not reorder the tables of such a join. The rows
+// therefore come in the order in which the events were sent, without a sort.
 constexpr std::string_view kAnalyticsEvents = R"sql(
 CREATE TABLE event_names(
   id INTEGER PRIMARY KEY,
@@ -42,8 +42,8 @@ CROSS JOIN event_names
   ON event_names.id = CASE which.twin WHEN 0 THEN record.name_id ELSE record.twin_name_id END;
 )sql";
 
-// The kinds whose records are stored one to a row, each with a table of spans as above. Other
-// programs read the views, so that the tables below them can change with the next version.
+// The other kinds of records, with a row for each record and a table of spans as above. Other
+// programs read the views, and the next version can therefore change the tables.
 constexpr std::string_view kOtherRecords = R"sql(
 CREATE TABLE issue_metric_records(
   id INTEGER PRIMARY KEY,
@@ -100,15 +100,15 @@ CREATE VIEW snapshots(time, signature, path) AS
 SELECT time, signature, path FROM snapshot_records;
 )sql";
 
-// Events and link messages of earlier versions stay in their tables until retention deletes them:
-// moving them would take minutes. New ones go into blocks, and the views show both. The tables
-// halvox_events and halvox_links unpack blocks. The programs of this system have these tables;
-// others load halvox-sqlite.so.
+// Events and link messages of earlier versions stay in their tables until retention deletes them,
+// because moving them would take minutes. New ones go into blocks, and the views show both. The
+// tables halvox_events and halvox_links unpack the blocks. The programs of this system have these
+// two tables built in; other programs load halvox-sqlite.so to get them.
 //
 // message_blocks.id is the number of the block's first record. Numbers continue after those of the
-// old tables. There, the events of record n have the numbers 2n and 2n + 1, and a link message has
-// the number of its record. The INSERT adds a block without records, which stores the first free
-// number.
+// old tables. In the old tables, the events of record n have the numbers 2n and 2n + 1, and a link
+// message has the number of its record. The INSERT adds a block without records. Its ID is the
+// first free number.
 //
 // message_spans has one row for each sealed block, with the same number as the block. Its keys say
 // which sessions, applications and names occur in the block (blocks/BlockKeys.h).
@@ -162,7 +162,7 @@ const std::int64_t kStoreSchemaVersion = kMigrations.size();
 SqliteCode migrate(Database& database) {
   const std::int64_t present = database.queryInteger("PRAGMA user_version").value_or(0);
   for (auto step = static_cast<std::size_t>(present); step < kMigrations.size(); ++step) {
-    // The version changes in the transaction of its step, so that no step is applied twice or in
+    // Change the version in the transaction of its step. No step can then be applied twice or in
     // part.
     const SqliteCode code =
         database.execute("BEGIN IMMEDIATE;" + std::string(kMigrations[step]) +

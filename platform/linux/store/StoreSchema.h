@@ -9,8 +9,8 @@ namespace halvox::platform::linux_ {
 
 constexpr std::string_view kStoreFileName = "halvox.db";
 
-// The number of records that one row of a table of spans summarises. Record `id` is in span
-// `id / kRecordsPerSpan`. Stored rows depend on this number: a change needs a migration.
+// How many records one row of a table of spans covers. Record `id` is in span `id /
+// kRecordsPerSpan`. Stored rows depend on this number, and changing it needs a migration.
 constexpr std::int64_t kRecordsPerSpan = 512;
 
 // The schema version that this program writes, stored in `PRAGMA user_version`.

@@ -6,8 +6,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// A commit has a fixed cost. In smaller batches it dominates, and the time per record says nothing
-// about a flood.
+// A batch must have this many records to show the time per record. In smaller batches the fixed
+// cost of a commit dominates, and their time per record says nothing about a flood.
 constexpr std::uint64_t kTellingRecords = 256;
 
 }  // namespace
@@ -38,7 +38,7 @@ void WriterQueue::requestRound() {
 
 bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
   const MutexLock lock(mutex_);
-  // Sleeps without a time limit: an idle service causes no wake-ups.
+  // Sleep without a time limit, because an idle service must cause no wake-ups.
   while (queued_ == 0 && !closed_ && !roundRequested_) {
     writer_ = Writer::kIdle;
     work_.wait(mutex_);
@@ -48,8 +48,8 @@ bool WriterQueue::take(Time notBefore, const std::function<void()>& take) {
     writer_ = Writer::kGathering;
     work_.waitUntil(mutex_, notBefore);
   }
-  // From here on, adding a record does not wake the writer, which checks for records before it
-  // sleeps.
+  // From here on, adding a record does not notify the writer. The writer looks for records before
+  // it sleeps again.
   writer_ = Writer::kWorking;
   workingSince_ = clock_();
   const bool wasRequested = std::exchange(roundRequested_, false);
@@ -66,14 +66,16 @@ void WriterQueue::finish(std::uint64_t records, std::uint64_t bytes) {
     const MutexLock lock(mutex_);
     waiting_ -= records;
     estimate(records, bytes);
-    // The estimate may have lowered the limits below what waits already.
+    // The estimate may have lowered the soft limit below the number of records that wait already.
     raiseIfBehind();
     wakeCallers = callersWaiting_ > 0;
-    // Well below the soft limit, so that connections do not stop and start again and again.
+    // Relieve only well below the soft limit. Connections would otherwise stop and start again and
+    // again.
     relieve = backpressure_.isHigh() && waiting_ <= softRecords_ / 4;
   }
   if (wakeCallers) room_.notifyAll();
-  // Call it outside the lock: the handler wakes the I/O thread, which may add records at once.
+  // Call relieve() without the lock. Its handler wakes the I/O thread, which may add records at
+  // once.
   if (relieve) backpressure_.relieve();
 }
 
@@ -117,11 +119,12 @@ void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {
   if (records == 0) return;
   const Time now = clock_();
   const std::chrono::nanoseconds elapsed = now - std::exchange(workingSince_, now);
-  // The estimates rise at once, and fall by at most a quarter with each batch. After an estimate
-  // that is too low, the limit is too high and breaks the promised half second. After one that is
-  // too high, the limit is too low and only slows callers for a moment.
+  // The estimates rise at once, but fall by at most a quarter with each batch. If an estimate is
+  // too low, the limits are too high, and records are not in the database within the promised half
+  // second. If an estimate is too high, the limits are too low, which only slows callers for a
+  // moment.
   bytesPerRecord_ = std::max(bytes / records, bytesPerRecord_ - bytesPerRecord_ / 4);
-  // A small batch also counts if it took as long as a full queue may take.
+  // Use the time of a small batch only if it was as long as a full queue may take.
   if (records >= kTellingRecords || elapsed >= limits_.softTime) {
     timePerRecord_ =
         std::max(elapsed / static_cast<std::int64_t>(records), timePerRecord_ - timePerRecord_ / 4);
@@ -130,7 +133,7 @@ void WriterQueue::estimate(std::uint64_t records, std::uint64_t bytes) {
   const auto byTime = static_cast<std::uint64_t>(
       limits_.softTime / std::max(timePerRecord_, std::chrono::nanoseconds(1)));
   softRecords_ = std::clamp<std::uint64_t>(std::min(bySize, byTime), 1, limits_.softRecords);
-  // At half the soft limit the writer starts, before backpressure slows the connections.
+  // The writer stops gathering at half the soft limit, before backpressure slows the connections.
   gatherRecords_ = std::clamp<std::uint64_t>(softRecords_ / 2, 1, limits_.gatherRecords);
 }
 

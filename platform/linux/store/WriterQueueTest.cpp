@@ -55,7 +55,7 @@ TEST(WriterQueueTest, RaisesBackpressureWhenTheLimitFallsBelowWhatWaits) {
   addMany(queue, 4);
   ASSERT_FALSE(queue.isBehind());
 
-  // Such payloads allow two records to wait, and callers wait from the fourth one on.
+  // With payloads of this size, the soft limit is two waiting records and the hard limit is four.
   queue.finish(2, 1000);
 
   EXPECT_TRUE(queue.isBehind());

@@ -5,8 +5,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// FNV-1a with a last step that mixes the upper bits into the lower ones. Not std::hash: other
-// builds must find the same keys.
+// FNV-1a with a last step that mixes the upper bits into the lower ones. std::hash cannot be used,
+// because other builds must find the same keys.
 class Hash {
  public:
   explicit Hash(BlockKeyKind kind) { add(static_cast<std::uint8_t>(kind)); }

@@ -51,7 +51,8 @@ TEST(BlockKeysTest, DamagedOrMissingKeysHideNothing) {
   EXPECT_TRUE(mayHave("abc", sessionKey(1)));
 }
 
-// Databases hold these keys: another program, or this one after a change, must find the same.
+// Databases hold these keys. Another program, or this one after a change, must compute the same
+// ones.
 TEST(BlockKeysTest, KeysDoNotChange) {
   EXPECT_EQ(sessionKey(-7), 55835U);
   EXPECT_EQ(blockKey(BlockKeyKind::kApplication, "com.example.player"), 63955U);

@@ -23,8 +23,9 @@ void MessageBlockReader::open(std::string_view block, std::int64_t records) {
   isDamaged_ = records < 0 || !unpack(block);
 }
 
-// The length of the content is in the frame. It is not trusted before memory for it is asked for:
-// zstd cannot make more than about 32,000 bytes of one.
+// Unpacks a block, whose zstd frame says how long its content is. A damaged length must not make
+// this function allocate much memory. It is compared with the length of the frame, because zstd
+// cannot make more than about 32,000 bytes of one byte.
 bool MessageBlockReader::unpack(std::string_view block) {
   constexpr std::uint64_t kMostBytesOfOne = std::uint64_t{1} << 17U;
   if (block.empty()) return records_ == 0;
@@ -50,7 +51,7 @@ bool MessageBlockReader::unpack(std::string_view block) {
 bool MessageBlockReader::next() {
   if (isDamaged_) return false;
   if (index_ + 1 >= records_) {
-    // Bytes after the last record: the number of records is wrong.
+    // If bytes remain after the last record, the number of records is wrong.
     isDamaged_ = !rest_.empty();
     return false;
   }

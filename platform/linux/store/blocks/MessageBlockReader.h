@@ -13,13 +13,13 @@
 
 namespace halvox::platform::linux_ {
 
-// One record of a block. Its views are valid until the reader moves on.
+// One record of a block. Its views are valid until the next call of next() or open().
 struct BlockRecord {
   BlockRecordKind kind = BlockRecordKind::kGap;
   double time = 0;               // seconds since 1970
-  std::string_view name;         // of an event, with the next one
+  std::string_view name;         // this and the next member: of an event
   std::string_view application;  // empty if the payload does not name it
-  std::int64_t sessionID = 0;    // of a link message, with the next four
+  std::int64_t sessionID = 0;    // this and the next four members: of a link message
   std::string_view clientName;
   std::string_view serviceName;
   std::int64_t category = 0;
@@ -31,20 +31,21 @@ struct BlockRecord {
 //
 //   open(); next() while it is true; then isDamaged()
 //
-// The bytes may be damaged in any way: then reading ends early and isDamaged() is true. Belongs to
-// one thread; keeps its memory from block to block.
+// The bytes may be damaged in any way. Reading then ends early and isDamaged() is true. Belongs to
+// one thread. Keeps its memory from block to block.
 class MessageBlockReader {
  public:
   MessageBlockReader() = default;
   MessageBlockReader(const MessageBlockReader&) = delete;
   MessageBlockReader& operator=(const MessageBlockReader&) = delete;
 
-  // Begins to read a block of `records` records. Refers to `block` until the last record is read.
+  // Begins to read a block of `records` records. `block` must exist until the last record has been
+  // read.
   void open(std::string_view block, std::int64_t records);
-  // Moves to the next record. Returns false after the last one, and when the block is damaged.
+  // Moves to the next record. Returns false after the last record, or if the block is damaged.
   [[nodiscard]] bool next();
   [[nodiscard]] const BlockRecord& record() const { return record_; }
-  // The position of the record in the block, from 0.
+  // Returns the position of the record in the block, counted from 0.
   [[nodiscard]] std::int64_t index() const { return index_; }
   [[nodiscard]] bool isDamaged() const { return isDamaged_; }
 

@@ -39,7 +39,7 @@ std::string line(const BlockRecord& record) {
 
 class MessageBlockTest : public ::testing::Test {
  protected:
-  // Reads a block; the last line is "damaged" if it is.
+  // Returns the records of a block as lines. If the block is damaged, the last line is "damaged".
   std::vector<std::string> lines(std::string_view block, std::uint64_t records) {
     std::vector<std::string> read;
     reader.open(block, static_cast<std::int64_t>(records));
@@ -220,7 +220,8 @@ TEST_F(MessageBlockTest, EveryFlippedBitOfACompressedBlockIsFound) {
     const char before = byte;
     byte = static_cast<char>(static_cast<unsigned char>(byte) ^ (1U << (bit % 8)));
     const auto read = lines(block, 120);
-    // A bit that zstd does not use may change nothing; no other text may come out.
+    // A changed bit may be one that zstd does not use, and the text is then unchanged. No other
+    // text may come out.
     EXPECT_TRUE(read == whole || read == std::vector<std::string>{"damaged"}) << bit;
     byte = before;
   }
@@ -236,13 +237,14 @@ TEST_F(MessageBlockTest, WrongNumberOfRecordsIsDamage) {
 }
 
 TEST_F(MessageBlockTest, ReferenceToAHeadThatDoesNotExistIsDamage) {
-  // An event of head 1, then time, shared bytes and rest, all 0.
+  // An event that refers to head 1, which does not exist; then time, shared bytes and rest, all 0.
   const std::string block{1, 1 | 1 << 2, 0, 0, 0};
   EXPECT_THAT(lines(block, 1), ElementsAre("damaged"));
 }
 
 TEST_F(MessageBlockTest, MoreSharedBytesThanThePayloadBeforeHasIsDamage) {
-  // An event of a new, empty name, time 0, one shared byte, no rest.
+  // An event with a new head and an empty name, time 0, one shared byte (there is no payload before
+  // it) and no rest.
   const std::string block{1, 1, 0, 0, 1, 0};
   EXPECT_THAT(lines(block, 1), ElementsAre("damaged"));
 }

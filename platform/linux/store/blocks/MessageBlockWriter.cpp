@@ -12,7 +12,8 @@ namespace {
 //   zstd  1   118 bytes  1.4 us
 //   zstd  3   116 bytes  1.6 us
 //   LZ4       194 bytes  0.7 us
-// A prepared dictionary gains nothing: zstd learns enough from the messages of the block itself.
+// A prepared dictionary gains nothing, because zstd learns enough from the messages of the block
+// itself.
 constexpr int kLevel = 1;
 constexpr std::size_t kKeptBytes = std::size_t{512} * 1024;
 
@@ -25,8 +26,8 @@ void appendBits(std::string& text, Number number) {
   text.append(reinterpret_cast<const char*>(&number), sizeof number);
 }
 
-// How many bytes at the beginning of both texts are equal. Compares a word at a time: payloads of
-// one session share hundreds of bytes.
+// Returns how many bytes at the beginning of both texts are equal. Compares a word at a time,
+// because payloads of one session share hundreds of bytes.
 std::size_t commonLength(std::string_view one, std::string_view other) {
   const std::size_t length = std::min(one.size(), other.size());
   std::size_t at = 0;
@@ -101,7 +102,8 @@ void MessageBlockWriter::addLink(double time, const LinkHead& head, std::string_
   addTimeAndPayload(time, payload);
 }
 
-// Searches from the newest: a block has few heads, and those of one message follow each other.
+// Searches the heads one by one, because a block has few. Begins with the newest, because the heads
+// of one message follow each other.
 bool MessageBlockWriter::addHead(BlockRecordKind kind, std::string_view head) {
   const auto number = static_cast<std::uint64_t>(kind);
   const auto matches = [&](const std::string& known) {

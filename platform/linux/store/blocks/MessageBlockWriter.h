@@ -28,7 +28,7 @@ struct LinkHead {
   std::uint16_t type;
 };
 
-// Packs events and link messages into a block (MessageBlock.h).
+// Packs events and link messages into blocks (MessageBlock.h).
 //
 //   addEvent(), addLink(), addGap() ...; finish(); clear(); and again
 //
@@ -40,20 +40,21 @@ class MessageBlockWriter {
   MessageBlockWriter(const MessageBlockWriter&) = delete;
   MessageBlockWriter& operator=(const MessageBlockWriter&) = delete;
 
-  // `time` is seconds since 1970, `payload` JSON text. Nothing refers to the arguments afterwards.
+  // `time` is seconds since 1970, `payload` is JSON text. The writer does not keep references to
+  // the arguments.
   void addEvent(double time, const EventHead& head, std::string_view payload);
   void addLink(double time, const LinkHead& head, std::string_view payload);
   // Adds a deleted record.
   void addGap();
 
-  // The records since the last clear(), and their bytes before compression.
+  // Return the number of records since the last clear(), and their bytes before compression.
   [[nodiscard]] std::uint64_t records() const { return records_; }
   [[nodiscard]] std::uint64_t bytes() const { return bytes_.size(); }
 
-  // Returns what readers may look for in the block, valid until any other call.
+  // Returns the keys of the block, to be stored in its span. Valid until any other call.
   [[nodiscard]] std::string_view keys() { return keys_.bytes(); }
-  // Returns the block, valid until any other call but keys(). kPlain is for blocks that are soon
-  // replaced.
+  // Returns the block, valid until any other call except keys(). Use kPlain for blocks that are
+  // soon replaced.
   [[nodiscard]] std::string_view finish(BlockPacking packing);
   // Begins the next block. Frees memory that only a long payload needed.
   void clear();
@@ -64,18 +65,19 @@ class MessageBlockWriter {
   void addNumber(std::uint64_t number);
   void addSigned(std::int64_t number);
   void addText(std::string_view text);
-  // Adds the reference to a head. Returns false for a new one, which the caller adds.
+  // Adds the reference to a head. Returns false if the head is new; the caller then adds the head
+  // itself.
   bool addHead(BlockRecordKind kind, std::string_view head);
   void addTimeAndPayload(double time, std::string_view payload);
 
-  std::string bytes_;  // the first byte is the packing, so that a plain block need not be copied
+  std::string bytes_;  // begins with the byte kPlain: a plain block need not be copied
   std::string packed_;
   std::string lastPayload_;
   BlockKeys keys_;
-  std::vector<std::string> heads_;  // what a record's head consists of, after its kind
+  std::vector<std::string> heads_;  // the heads of this block, each with its kind at the end
   std::string head_;
   std::uint64_t records_ = 0;
-  std::uint64_t lastTime_ = 0;  // the bits
+  std::uint64_t lastTime_ = 0;  // the bits of the last record's time
   UniqueHandle<ZSTD_CCtx*, ZSTD_freeCCtx> compressor_;
 };
 

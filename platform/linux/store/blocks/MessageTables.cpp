@@ -23,18 +23,19 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr int kTimeColumn = 0;
-// Of halvox_events. Hidden: `SELECT *` and the view do not have it.
+// A hidden column of halvox_events: neither `SELECT *` nor the view has it.
 constexpr int kApplicationColumn = 3;
 
-// What xBestIndex tells xFilter: which conditions come as arguments, in this order. The condition
-// on a column whose values are keys of blocks has the flag kKeyOfColumn shifted by the column.
+// Flags that xBestIndex passes to xFilter. They say which conditions come as arguments, in this
+// order. A condition on a column whose values are keys of blocks has the flag kKeyOfColumn, shifted
+// by the number of the column.
 constexpr unsigned kSince = 1;
 constexpr unsigned kUntil = 2;
 constexpr unsigned kAt = 4;
 constexpr unsigned kKeyOfColumn = 8;
 constexpr int kKeyColumns = 4;
 
-// Which keys the values of a column are; std::nullopt if none.
+// Returns the kind of keys that the values of a column are; std::nullopt if they are not keys.
 std::optional<BlockKeyKind> keyKindOf(BlockRecordKind kind, int column) {
   if (kind == BlockRecordKind::kEvent) {
     if (column == 1) return BlockKeyKind::kName;
@@ -47,13 +48,13 @@ std::optional<BlockKeyKind> keyKindOf(BlockRecordKind kind, int column) {
   return std::nullopt;
 }
 
-// One of the two tables. `kind` is static.
+// One of the two tables. `kind` points to a static variable.
 struct MessageTable : sqlite3_vtab {
   sqlite3* database;
   const BlockRecordKind* kind;
 };
 
-// One pass over the blocks. The reader refers to the row of `block`.
+// One pass over the blocks. The reader refers to the bytes in the current row of `block`.
 struct MessageCursor : sqlite3_vtab_cursor {
   ~MessageCursor() {
     sqlite3_finalize(blocks);
@@ -81,7 +82,8 @@ int connect(sqlite3* database, void* kind, int /*count*/, const char* const* /*a
                     : "CREATE TABLE x(time REAL, session_id INTEGER, client_name TEXT,"
                       " service_name TEXT, category INTEGER, type INTEGER, payload TEXT)");
   if (code != SQLITE_OK) return code;
-  // The tables read only this database, so that views may use them whatever trusted_schema says.
+  // Declare the tables as innocuous, because they read only this database. Views may then use them
+  // even if trusted_schema is off.
   sqlite3_vtab_config(database, SQLITE_VTAB_INNOCUOUS);
   auto made = std::make_unique<MessageTable>();
   made->database = database;
@@ -105,14 +107,14 @@ int closeCursor(sqlite3_vtab_cursor* cursor) {
   return SQLITE_OK;
 }
 
-// Returns the flag of a condition that skips blocks, or 0 for any other.
+// Returns the flag of a condition that allows skipping blocks, or 0 for any other condition.
 unsigned flagOf(BlockRecordKind kind, const sqlite3_index_info* info, int index) {
   const auto& constraint = info->aConstraint[index];
   if (constraint.usable == 0) return 0;
   const bool isEqual = constraint.op == SQLITE_INDEX_CONSTRAINT_EQ;
   if (constraint.iColumn != kTimeColumn) {
     if (!isEqual || !keyKindOf(kind, constraint.iColumn).has_value()) return 0;
-    // NOCASE and other orders find texts that have other keys.
+    // Under NOCASE and other collations, texts with different keys can be equal.
     const char* const collation =
         sqlite3_vtab_collation(const_cast<sqlite3_index_info*>(info), index);
     if (sqlite3_stricmp(collation, "BINARY") != 0) return 0;
@@ -132,7 +134,8 @@ unsigned flagOf(BlockRecordKind kind, const sqlite3_index_info* info, int index)
   }
 }
 
-// Takes one condition for each flag. SQLite tests each row again: they need not be exact.
+// Takes one condition for each flag. The conditions need not be exact, because SQLite tests each
+// row again.
 int chooseIndex(sqlite3_vtab* table, sqlite3_index_info* info) {
   const BlockRecordKind kind = *tableOf(table).kind;
   unsigned flags = 0;
@@ -176,7 +179,7 @@ int openNextBlock(MessageCursor& cursor) {
     sqlite3_reset(cursor.block);
     sqlite3_bind_int64(cursor.block, 1, cursor.blockID);
     code = sqlite3_step(cursor.block);
-    // A span without a block has no records.
+    // A span may be left without a block. It has no records then.
     if (code == SQLITE_DONE) continue;
     if (code == SQLITE_ROW) {
       cursor.reader.open(bytesOf(cursor.block, 1), sqlite3_column_int64(cursor.block, 0));
@@ -208,8 +211,8 @@ int advance(sqlite3_vtab_cursor* base) {
   }
 }
 
-// The key of an argument. A value of another type than the column's has none: it may be equal to a
-// value of the column only after conversion.
+// Returns the key of an argument; std::nullopt if its type differs from the column's. Such a value
+// can be equal to a value of the column after conversion, and its key would not find that one.
 std::optional<BlockKey> keyOf(BlockKeyKind kind, sqlite3_value* value) {
   if (kind == BlockKeyKind::kSession) {
     if (sqlite3_value_type(value) != SQLITE_INTEGER) return std::nullopt;
@@ -225,8 +228,9 @@ int prepare(MessageCursor& cursor) {
   sqlite3* const database = tableOf(cursor.pVtab).database;
   sqlite3_finalize(std::exchange(cursor.blocks, nullptr));
   sqlite3_finalize(std::exchange(cursor.block, nullptr));
-  // The newest rows have no span. Only a block that is wanted is read: the spans of a store are a
-  // hundredth of its blocks.
+  // The first statement finds the blocks: by their spans, and the newest rows, which have no span.
+  // The second statement reads one block, and only if it is wanted, because the blocks of a store
+  // have a hundred times as many bytes as its spans.
   const int code = sqlite3_prepare_v2(
       database,
       "SELECT span, keys FROM main.message_spans WHERE last_time >= ?1 AND first_time <= ?2"
@@ -314,7 +318,8 @@ int readNumber(sqlite3_vtab_cursor* base, sqlite3_int64* number) {
   return SQLITE_OK;
 }
 
-// Without xCreate the table exists in each database under the name of the module alone.
+// Because xCreate is null, each database has the table under the name of its module, without CREATE
+// VIRTUAL TABLE.
 const sqlite3_module kModule{.iVersion = 0,
                              .xCreate = nullptr,
                              .xConnect = connect,

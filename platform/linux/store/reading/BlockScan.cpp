@@ -11,7 +11,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Clients choose names. When this many are remembered, other names are matched each time.
+// Remember the result of matching for this many names. Other names are matched each time. The
+// number is bounded because clients choose the names.
 constexpr std::size_t kMostNames = 4096;
 constexpr std::int64_t kAfterAll = std::numeric_limits<std::int64_t>::max();
 
@@ -37,7 +38,7 @@ SqliteCode BlockScan::begin() {
   if (code == SQLITE_OK) code = findRanges();
   if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);
   if (code != SQLITE_OK) return code;
-  // The row that has the number, or the first one after it.
+  // Finds the row that contains the number, or else the first row after it.
   return database_.prepare(
       "SELECT id, records, block FROM message_blocks"
       " WHERE id >= (SELECT ifnull(max(id), 0) FROM message_blocks WHERE id <= ?1)"
@@ -66,8 +67,8 @@ std::vector<BlockScan::Alternatives> BlockScan::wantedKeys() const {
   return wanted;
 }
 
-// The spans say which blocks may have records to read. Rows without a span are the newest ones, and
-// are few: they are always read.
+// The spans show which blocks may have records to read. The newest rows have no span. They are
+// always read, because they are few.
 SqliteCode BlockScan::findRanges() {
   Statement spans;
   SqliteCode code = database_.prepare(
@@ -88,8 +89,8 @@ SqliteCode BlockScan::findRanges() {
   return SQLITE_OK;
 }
 
-// Adds the ranges of the spans that may have records to read. The last one ends after all records
-// if it has the newest span, whose length is not known here.
+// Adds the ranges of the spans that may have records to read. If a range includes the newest span,
+// it has no upper end, because the length of that span is not known here.
 SqliteCode BlockScan::addRanges(Statement& spans, std::int64_t& newestSpan) {
   const std::vector<Alternatives> wanted = wantedKeys();
   const auto mayPass = [&] {
@@ -139,8 +140,8 @@ SqliteCode BlockScan::skipToNewest(std::uint64_t count) {
   return code;
 }
 
-// Counts the records of the loaded block that pass. When there are enough, reading begins with the
-// first of them. Returns false if the block is damaged.
+// Counts the records of the loaded block that pass. If no more are missing then, reading will begin
+// with the first record that is wanted. Returns false if the block is damaged.
 bool BlockScan::countNewest() {
   std::vector<StoredRecordID> found;
   while (nextRecord()) found.push_back(id());

@@ -17,10 +17,10 @@
 namespace halvox::platform::linux_ {
 
 // One pass over the events, the link messages or both in blocks that pass a filter. Copies one
-// block at a time and holds no snapshot while its records are used: see StoreReader. Meanwhile the
-// store may join blocks. Numbers do not change: the pass meets each record once. The pass ends with
-// the last record that was stored when it began. Belongs to the thread of its database and does not
-// own its arguments. After an error the scan is over.
+// block at a time and holds no snapshot while its records are used; StoreReader says why. In that
+// time the store may join blocks, but the pass still reads each record once, because records keep
+// their numbers. The pass ends with the last record that was stored when it began. Belongs to the
+// thread of its database and does not own its arguments. After an error the scan is over.
 //
 //   begin(); bool found = false; then nextBlock(found), and nextRecord() while it is true, until
 //   nothing is found
@@ -33,30 +33,32 @@ class BlockScan {
 
   // Finds the first and the last record to read. Call once.
   [[nodiscard]] SqliteCode begin();
-  // How many of RecordFilter::newest must come from before all blocks.
+  // Returns how many of the RecordFilter::newest records the blocks do not have. They must come
+  // from the old tables.
   [[nodiscard]] std::uint64_t missing() const { return missing_; }
 
-  // Loads the next block that may have records to read, and sets `found`. Pass false to the first
-  // call, and to each later one the value that the call before it set.
+  // Loads the next block that may have records to read, and sets `found` to whether there is one.
+  // Pass false to the first call, and to each later call the value that the previous call has set.
   [[nodiscard]] SqliteCode nextBlock(bool& found);
-  // Moves to the next record of the block that passes. Its views are valid until the next call.
+  // Moves to the next record of the block that passes the filter. The record's views are valid
+  // until the next call.
   [[nodiscard]] bool nextRecord();
   [[nodiscard]] const BlockRecord& record() const { return reader_.record(); }
   [[nodiscard]] StoredRecordID id() const { return blockID_ + reader_.index(); }
-  // True after nextRecord() came to damage. The scan is over then.
+  // Returns true if nextRecord() has found damage. The scan is over then.
   [[nodiscard]] bool isDamaged() const { return reader_.isDamaged(); }
 
-  // The last record that the whole pass looks at, whether the filter lets it through or not; known
-  // after begin(). 0 if there are no blocks.
+  // Returns the number of the last record that the pass looks at, whether or not it passes the
+  // filter. Known after begin(). 0 if there are no blocks.
   [[nodiscard]] StoredRecordID last() const { return stored_; }
 
  private:
-  // Numbers from `from` up to, but not including, `to`.
+  // The record numbers from `from` up to, but not including, `to`.
   struct Range {
     std::int64_t from;
     std::int64_t to;
   };
-  // At least one of these keys is in each block with records that pass.
+  // Each block with records that pass has at least one of these keys.
   using Alternatives = std::vector<BlockKey>;
 
   [[nodiscard]] std::vector<Alternatives> wantedKeys() const;
@@ -73,8 +75,8 @@ class BlockScan {
   Database& database_;
   const std::optional<BlockRecordKind> kind_;
   const RecordFilter& filter_;
-  // The numbers to read: those from next_ to last_ that are in ranges_. The ranges are in ascending
-  // order; those before range_ are read.
+  // The record numbers to read are those from next_ to last_ that are in ranges_. The ranges are in
+  // ascending order. Those before range_ have been read.
   std::int64_t next_ = 1;
   std::int64_t last_ = 0;
   std::vector<Range> ranges_;
@@ -89,7 +91,7 @@ class BlockScan {
   std::map<std::string, bool, std::less<>> names_;  // which names pass
 };
 
-// A link message in the form that all kinds have.
+// Returns a link message of a block in the form that the records of all kinds have.
 [[nodiscard]] StoredRecord linkRecord(StoredRecordID id, const BlockRecord& record);
 
 }  // namespace halvox::platform::linux_

@@ -16,8 +16,9 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// inotify reports the write to the log, but readers see the commit only a moment later, and that is
-// not reported. After each report the follower therefore looks three more times, 25 ms apart.
+// inotify reports the write to the write-ahead log, but readers see the commit only a moment later,
+// which inotify does not report. After each report the follower therefore looks three more times,
+// 25 ms apart.
 constexpr int kLooksAgain = 3;
 constexpr long kLookAgainNanoseconds = 25'000'000;
 
@@ -30,7 +31,8 @@ Failure<StoreError> systemFailure(const std::filesystem::path& directory) {
   return {kind, directory.native() + ": cannot watch the directory: " + errnoText(errno)};
 }
 
-// The -shm file does not count: readers also write to it, and the follower would wake itself.
+// Returns false for the -shm file, because readers write to it, too, and the follower would wake
+// itself.
 bool isStoreFile(std::string_view name) {
   return name.starts_with(kStoreFileName) && !name.ends_with("-shm");
 }
@@ -42,13 +44,13 @@ Result<void, StoreError> EventFollower::open(const std::filesystem::path& direct
   directory_ = directory;
   filter_ = filter;
   started_ = false;
-  // Callers wait on one descriptor, which covers both sources.
+  // Callers wait on one descriptor. epoll combines the watch and the timer in it.
   poller_.reset(::epoll_create1(EPOLL_CLOEXEC));
   timer_.reset(::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC));
   watch_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (!poller_ || !timer_ || !watch_) return systemFailure(directory);
-  // Watch before the first read. A record stored after the read but before the watch would go
-  // unnoticed.
+  // Watch before the first read. A record that is stored after the read but before the watch would
+  // go unnoticed.
   if (::inotify_add_watch(watch_.get(), directory.c_str(), kWatched) < 0) {
     return systemFailure(directory);
   }
@@ -89,18 +91,18 @@ Result<void, StoreError> EventFollower::deliverBy(Read read) {
   }
   started_ = true;
   Result<void, StoreError> done = read();
-  // Continue after the last record that was read, not the last one that was delivered. If the
-  // filter lets none through, as with `newest` 0, all stored records would otherwise count as new
+  // Continue after the last record that was read, not after the last one that was delivered. If no
+  // record passes the filter, as with `newest` 0, all stored records would otherwise count as new
   // the next time.
   if (done) filter_.after = std::max(filter_.after, reader_.lastRead());
-  // `newest` limits only the first delivery: everything that is stored later is new.
+  // `newest` limits only the first delivery, because everything that is stored later is new.
   filter_.newest.reset();
   return done;
 }
 
-// Opens the database that replaced the old one; its record IDs start from 1. Returns false while
-// there is none. A database that is still being created can fail in any way. An error therefore
-// counts only at the last attempt.
+// Opens the database that replaced the old one. Its record IDs start from 1. Returns false while
+// there is no such database. Opening a database that is still being created can fail in any way.
+// Only the error of the last attempt is therefore returned.
 Result<bool, StoreError> EventFollower::reopen() {
   auto opened = reader_.open(directory_);
   if (opened) {
@@ -123,7 +125,8 @@ EventFollower::Change EventFollower::readChanges() {
       if ((event->mask & (IN_DELETE_SELF | IN_MOVE_SELF | IN_IGNORED)) != 0) {
         return Change::kDirectoryGone;
       }
-      // The kernel has dropped events, and some of them may have concerned the store.
+      // After an overflow the kernel has dropped events, and some of them may have concerned the
+      // store.
       const bool overflow = (event->mask & IN_Q_OVERFLOW) != 0;
       if (overflow || (event->len > 0 && isStoreFile(event->name))) change = Change::kStoreWritten;
     }

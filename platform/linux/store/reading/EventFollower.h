@@ -9,26 +9,26 @@
 
 namespace halvox::platform::linux_ {
 
-// Follows a store: delivers the records of one kind as the service stores them, each once. Keeps
-// following when the service ends, starts again or creates a new database. Belongs to one thread
-// and one owner. Sets a timer only after the store was written to, so that a quiet store causes no
-// wake-ups.
+// Follows a store. Delivers each record of one kind once, soon after the service has stored it.
+// Continues to follow when the service ends, starts again or creates a new database. Belongs to one
+// thread and one owner. Sets a timer only after the store was written to. A quiet store therefore
+// causes no wake-ups.
 //
 //   open(); deliver(); then call deliver() each time that descriptor() is readable
 class EventFollower {
  public:
-  // Starts to watch the store in `directory`. The first deliver() has the records that are stored
-  // already and pass the filter. Fails as StoreReader::open() does, or with kCannotOpen or kMissing
-  // when the directory cannot be watched.
+  // Starts to watch the store in `directory`. The first deliver() delivers the records that are
+  // stored already and pass the filter. Fails like StoreReader::open(), or with kCannotOpen or
+  // kMissing if the directory cannot be watched.
   Result<void, StoreError> open(const std::filesystem::path& directory, const RecordFilter& filter);
   // Becomes readable (poll) when deliver() should be called. Owned by this object.
   [[nodiscard]] int descriptor() const { return poller_.get(); }
   // Calls `callback` on this thread for each event that was stored since the last delivery. Does
-  // not wait for events. Returns an error when the directory was removed or the database cannot be
+  // not wait for events. Returns an error if the directory was removed or the database cannot be
   // read. Following then ends.
   Result<void, StoreError> deliver(const StoreReader::EventCallback& callback);
-  // Delivers the records of another kind in the same way. Do not mix kinds in one follower: it
-  // remembers one position.
+  // Delivers the records of another kind in the same way. Do not mix kinds in one follower, because
+  // it remembers only one position.
   Result<void, StoreError> deliver(const RecordTable& table,
                                    const StoreReader::RecordCallback& callback);
 

@@ -15,7 +15,8 @@ using ::testing::IsEmpty;
 
 class EventFollowerTest : public StoreFixture {
  protected:
-  // Delivers until `count` events were seen in all. Returns false when they do not arrive in time.
+  // Calls deliver() until `count` events were seen in all. Returns false if they do not arrive in
+  // time.
   bool follow(std::size_t count) {
     bool isReadable = true;
     const auto deliver = [&] {

@@ -6,7 +6,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Columns of the statements that read records.
+// The columns of the statements that read records.
 enum Column : int { kID, kTime, kNameID, kTwinTime, kTwinNameID, kPayload };
 
 constexpr std::int64_t recordOf(StoredRecordID event) { return event / 2; }
@@ -14,7 +14,7 @@ constexpr std::int64_t recordOf(StoredRecordID event) { return event / 2; }
 }  // namespace
 
 SqliteCode EventScan::begin() {
-  // Begin with this record and not with the next one: its second event may be newer than `after`.
+  // Begin with the record that holds the event `after`, because its second event may be newer.
   bounds_.first = recordOf(filter_.after);
   SqliteCode code = findBounds(database_, "analytics_records", "analytics_spans", filter_, bounds_);
   if (code == SQLITE_OK && filter_.newest.has_value()) code = skipToNewest(*filter_.newest);
@@ -37,7 +37,7 @@ SqliteCode EventScan::skipToNewest(std::uint64_t count) {
   StoredRecordID begin = 2 * (bounds_.last + 1);
   std::uint64_t found = 0;
   while (found < count && (code = statement.step()) == SQLITE_ROW) {
-    // Read the twin first, because this loop reads from the newest event back.
+    // Read the twin first, because this loop goes from the newest event backwards.
     for (const int which : {1, 0}) {
       Event event{};
       if (found >= count || !readEvent(statement, which, event)) continue;
@@ -46,7 +46,7 @@ SqliteCode EventScan::skipToNewest(std::uint64_t count) {
     }
   }
   if (code != SQLITE_OK && code != SQLITE_ROW && code != SQLITE_DONE) return code;
-  // The first record may hold an event that is not among the newest.
+  // Exclude the first event of the first record if only its twin is among the newest.
   after_ = std::max(after_, begin - 1);
   bounds_.first = recordOf(begin);
   return SQLITE_OK;
@@ -96,8 +96,9 @@ bool EventScan::passes(const Event& event) {
   return event.id > after_ && isWithinTimes(filter_, event.time) && name(event.nameID).matches;
 }
 
-// Names are looked up one by one and kept: there are few, and the service may add names between two
-// pieces. A name that cannot be read stays empty.
+// Looks a name up at its first use and keeps it. There are few names, and reading all of them at
+// the start would miss those that the service adds between two pieces. A name that cannot be read
+// stays empty.
 const EventScan::Name& EventScan::name(std::int64_t nameID) {
   const auto known = names_.find(nameID);
   if (known != names_.end()) return known->second;

@@ -12,8 +12,9 @@
 namespace halvox::platform::linux_ {
 
 // One pass over the stored events that pass a filter. Reads in pieces, and holds no snapshot
-// between them: see StoreReader. Ends with the last event that was stored when it began. Belongs to
-// the thread of its database and does not own its arguments. After an error the scan is over.
+// between two pieces; StoreReader says why. Ends with the last event that was stored when it began.
+// Belongs to the thread of its database and does not own its arguments. After an error the scan is
+// over.
 //
 // An event's ID is twice the number of its record, plus 1 for the twin.
 class EventScan {
@@ -34,12 +35,12 @@ class EventScan {
 
   // Finds the first and the last record to read. Call once, before next().
   [[nodiscard]] SqliteCode begin();
-  // Reads the next piece. An empty piece is not the end: more may follow until isAtEnd().
+  // Reads the next piece. A piece may be empty although more follow. Only isAtEnd() shows the end.
   [[nodiscard]] SqliteCode next(Piece& piece);
   [[nodiscard]] bool isAtEnd() const { return bounds_.first > bounds_.last; }
 
-  // The last event that the whole pass looks at, whether the filter lets it through or not; known
-  // after begin().
+  // Returns the last event that the pass looks at, whether or not it passes the filter. Known after
+  // begin().
   [[nodiscard]] StoredRecordID last() const { return 2 * bounds_.last + 1; }
 
   [[nodiscard]] std::string_view nameOf(std::int64_t nameID) { return name(nameID).text; }
@@ -50,8 +51,8 @@ class EventScan {
     bool matches = false;
   };
 
-  // Reads an event from the statement's row: 0 is the record's first event, 1 its twin. Returns
-  // false when there is none or it does not pass the filter.
+  // Reads an event from the statement's row. `which` is 0 for the record's first event and 1 for
+  // its twin. Returns false if the record has no twin or the event does not pass the filter.
   [[nodiscard]] bool readEvent(const Statement& row, int which, Event& event);
   [[nodiscard]] bool passes(const Event& event);
   [[nodiscard]] const Name& name(std::int64_t nameID);

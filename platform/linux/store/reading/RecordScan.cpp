@@ -10,7 +10,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The columns of the statement that reads records. The columns of the RecordTable follow.
+// The first columns of the statement that reads records. The columns of the RecordTable follow.
 enum Column : int { kID, kTime, kFirstColumn };
 
 constexpr int columnOf(std::size_t field) { return kFirstColumn + static_cast<int>(field); }
@@ -35,7 +35,8 @@ SqliteCode findBounds(Database& database, const std::string& recordsTable,
       readBound(database, "SELECT ifnull(max(id), 0) FROM " + recordsTable, 0, bounds.last);
   if (code == SQLITE_OK && filter.since.has_value()) {
     std::int64_t span = 0;
-    // Begins with the newest span if none is recent enough. With 0, all records would be read.
+    // If no span is recent enough, begin with the newest span. Span 0 would make the scan read all
+    // records.
     code = readBound(database,
                      "SELECT ifnull(min(span), (SELECT max(span) FROM " + spansTable + ")) FROM " +
                          spansTable + " WHERE last_time >= ?1",
@@ -82,7 +83,7 @@ SqliteCode RecordScan::prepare(std::string_view order, Statement& statement) {
 
 SqliteCode RecordScan::skipToNewest(std::uint64_t count) {
   Statement statement;
-  // Read from the newest record back, so that no more records are read than are wanted.
+  // Read from the newest record backwards, to read no more records than needed.
   SqliteCode code = prepare("DESC", statement);
   if (code != SQLITE_OK) return code;
   statement.bind(1, bounds_.first);
@@ -107,12 +108,13 @@ SqliteCode RecordScan::next(std::vector<StoredRecord>& piece) {
   for (int looks = 0; looks < kLooksPerPiece; ++looks) {
     code = read_.step();
     if (code != SQLITE_ROW) break;
-    // Advance past a record that does not pass, too: the next piece must not read it again.
+    // Advance past a record that does not pass the filter, too. The next piece must not read it
+    // again.
     bounds_.first = read_.integer(kID) + 1;
     if (passes(read_)) piece.push_back(read(read_, bytes));
     if (piece.size() >= kRecordsPerPiece || bytes >= kBytesPerPiece) break;
   }
-  // Ends the snapshot before the caller's callback runs, which may take as long as it likes.
+  // End the snapshot before the caller's callback runs, because the callback may take any time.
   read_.reset();
   if (code == SQLITE_DONE) bounds_.first = bounds_.last + 1;
   return code == SQLITE_DONE || code == SQLITE_ROW ? SQLITE_OK : code;

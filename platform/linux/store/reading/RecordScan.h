@@ -11,31 +11,32 @@
 
 namespace halvox::platform::linux_ {
 
-// The range of record numbers to read. All records that pass a filter are in it; not every record
-// in it passes.
+// The range of record numbers to read. It includes all records that pass a filter, and may include
+// others.
 struct RecordBounds {
   std::int64_t first = 1;
   std::int64_t last = 0;
 };
 
-// Narrows the bounds to the filter's times. Uses the spans and reads no records. The caller sets
-// `bounds.first` to the first record that it may need.
+// Narrows the bounds to the times of the filter. Uses the spans and reads no records. Before the
+// call, set `bounds.first` to the first record that may be needed.
 [[nodiscard]] SqliteCode findBounds(Database& database, const std::string& recordsTable,
                                     const std::string& spansTable, const RecordFilter& filter,
                                     RecordBounds& bounds);
 [[nodiscard]] bool isWithinTimes(const RecordFilter& filter, double time);
-// Returns true when at least one pattern matches, or there are no patterns.
+// Returns true if at least one pattern matches, or if there are no patterns.
 [[nodiscard]] bool matchesAny(const std::vector<std::string>& patterns, const std::string& name);
 
-// A piece of a scan ends at the first of these bounds. The first two bound its memory. The third
-// bounds the time that it holds a snapshot when few records pass the filter.
+// A piece of a scan ends when the first of these bounds is reached. The first two bound the memory
+// of a piece. The third bounds how long a snapshot is held if few records pass the filter.
 constexpr std::size_t kRecordsPerPiece = 512;
 constexpr std::size_t kBytesPerPiece = 1U << 20U;
 constexpr int kLooksPerPiece = 50'000;
 
 // One pass over the records of one kind that pass a filter. Reads in pieces, and holds no snapshot
-// between them: see StoreReader. Ends with the last record that was stored when it began. Belongs
-// to the thread of its database and does not own its arguments. After an error the scan is over.
+// between two pieces; StoreReader says why. Ends with the last record that was stored when it
+// began. Belongs to the thread of its database and does not own its arguments. After an error the
+// scan is over.
 class RecordScan {
  public:
   RecordScan(Database& database, const RecordTable& table, const RecordFilter& filter)
@@ -43,10 +44,10 @@ class RecordScan {
 
   // Finds the first and the last record to read. Call once, before next().
   [[nodiscard]] SqliteCode begin();
-  // Reads the next piece. An empty piece is not the end: more may follow until isAtEnd().
+  // Reads the next piece. A piece may be empty although more follow. Only isAtEnd() shows the end.
   [[nodiscard]] SqliteCode next(std::vector<StoredRecord>& piece);
   [[nodiscard]] bool isAtEnd() const { return bounds_.first > bounds_.last; }
-  // The last record that the whole pass looks at, whether the filter lets it through or not; known
+  // Returns the last record that the pass looks at, whether or not it passes the filter. Known
   // after begin().
   [[nodiscard]] StoredRecordID last() const { return bounds_.last; }
 

@@ -15,7 +15,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The other names, and the tables whose records they show.
+// The names of the other tables of an export, and the tables of the store from which their records
+// come.
 constexpr std::array<std::pair<std::string_view, const RecordTable*>, 4> kKinds{
     {{"issue_metrics", &kIssueMetrics},
      {"power_events", &kPowerEvents},
@@ -55,12 +56,12 @@ StoreExport::~StoreExport() {
 }
 
 Result<void> StoreExport::create() {
-  // SQLite opens an empty file as an empty database.
+  // Create an empty file, which SQLite opens as an empty database.
   if (!std::ofstream(part_, std::ios::trunc)) {
     return Failure<>{part_.native() + ": " + errnoText(errno)};
   }
   std::string sql =
-      // The file need not survive a crash: an export that fails is deleted.
+      // The file need not survive a crash, because a failed export is deleted.
       "PRAGMA journal_mode = OFF; PRAGMA synchronous = OFF; BEGIN;"
       "CREATE TABLE analytics_events(time REAL NOT NULL, name TEXT NOT NULL, payload TEXT NOT "
       "NULL);";

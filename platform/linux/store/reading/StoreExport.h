@@ -10,7 +10,7 @@
 namespace halvox::platform::linux_ {
 
 // Writes a database in which the five views of a store are plain tables with the same columns. Any
-// program that reads SQLite can read it without the store's extension.
+// program that can read SQLite can read this database without the store's extension.
 //
 //   create(); copyFrom(); finish()
 //
@@ -24,8 +24,8 @@ class StoreExport {
   ~StoreExport();
 
   Result<void> create();
-  // Copies the records that pass the filter, of all kinds. Reads as StoreReader does: a service may
-  // write meanwhile. Returns why the store cannot be read or the file cannot be written.
+  // Copies the records of all kinds that pass the filter. A service may write to the store at the
+  // same time. The error says why the store cannot be read or the file cannot be written.
   Result<void> copyFrom(StoreReader& reader, const RecordFilter& filter);
   // Gives the file its name. Replaces an existing file of that name.
   Result<void> finish();
@@ -37,7 +37,7 @@ class StoreExport {
   Result<void> copyKind(std::string_view name, const RecordTable& table, StoreReader& reader,
                         const RecordFilter& filter);
   void insert(Statement& statement);
-  // The error of reading a kind or of writing its rows, if there is one.
+  // Returns the error of reading a kind or of writing its rows, or success.
   [[nodiscard]] Result<void> outcome(const Result<void, StoreError>& read) const;
   [[nodiscard]] Failure<> cannotWrite() const;
 

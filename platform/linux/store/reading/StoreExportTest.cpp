@@ -46,7 +46,7 @@ class StoreExportTest : public StoreFixture {
     if (done) done = exported.finish();
     return done;
   }
-  // What SQLite alone reads, without the tables that unpack messages.
+  // Runs a query with plain SQLite, without the tables that unpack messages.
   [[nodiscard]] std::string plainValue(const std::string& sql) const {
     Database database;
     Statement statement;

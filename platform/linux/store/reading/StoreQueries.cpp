@@ -15,8 +15,9 @@ constexpr const char* kOnlyReading =
 
 constexpr std::array<std::string_view, 3> kPragmas{"table_info", "table_xinfo", "table_list"};
 
-// Decides what a statement may do while SQLite compiles it. Everything that is not named is denied:
-// attaching other files, transactions that would outlive the statement, and all changes.
+// SQLite calls this function while it compiles a statement, to learn what the statement may do.
+// Everything that is not listed is denied, such as attaching other files, transactions that would
+// outlive the statement, and all changes.
 int authorize(void* /*context*/, int action, const char* first, const char* /*second*/,
               const char* /*schema*/, const char* /*trigger*/) {
   switch (action) {
@@ -60,7 +61,8 @@ StoreQueries::Value valueOf(sqlite3_stmt* statement, int column) {
 Result<void, StoreError> StoreQueries::open(const std::filesystem::path& directory) {
   if (auto opened = reader_.open(directory); !opened) return opened;
   Database& database = reader_.database();
-  // A statement that uses the tables makes them, which the authorizer would deny.
+  // The first statement that uses the tables makes them, which the authorizer would deny. Make them
+  // before it is set.
   Statement tables;
   if (addMessageTables(database.get()) != SQLITE_OK ||
       database.prepare("SELECT 1 FROM halvox_events, halvox_links", tables) != SQLITE_OK) {
@@ -97,7 +99,7 @@ Result<void> StoreQueries::runFirst(std::string_view& sql, const ColumnsCallback
     }
     row(values);
   }
-  // VACUUM is denied only when it runs.
+  // SQLite asks the authorizer about VACUUM only when it runs.
   if (code == SQLITE_AUTH) return Failure<>{kOnlyReading};
   if (code != SQLITE_DONE) return Failure<>{database.errorText()};
   return {};

@@ -16,12 +16,13 @@
 
 namespace halvox::platform::linux_ {
 
-// Answers questions in SQL about a store, whether or not a service writes to it. The tables that
-// unpack messages are compiled in. Only reading is allowed: SELECT, and the pragmas that describe
-// tables. Belongs to one thread and one owner.
+// Runs queries in SQL on a store, whether or not a service writes to it. The tables that unpack
+// messages are compiled in. Allows only reading: SELECT, and the pragmas that describe tables.
+// Belongs to one thread and one owner.
 //
-// While a statement runs it holds a snapshot, which keeps the service from reusing its write-ahead
-// log. The callbacks must not wait for anything slow, such as the reader of a pager.
+// While a statement runs, it holds a snapshot, which keeps the service from reusing its write-ahead
+// log. The callbacks must therefore not wait for anything slow, such as a person who reads the
+// output in a pager.
 class StoreQueries {
  public:
   // One value of a row; a null is std::monostate. Views are valid during the callback only.
@@ -33,9 +34,9 @@ class StoreQueries {
   // Opens the store in `directory`. Fails as StoreReader::open() does.
   Result<void, StoreError> open(const std::filesystem::path& directory);
 
-  // Runs the first statement of `sql` and removes it from there. Calls `columns` before the first
-  // row, even if there are no rows. Returns why the statement cannot be run; the rows before an
-  // error have been delivered. Blanks and comments alone are not an error.
+  // Runs the first statement of `sql` and removes it from `sql`. Calls `columns` before the first
+  // row, even if there are no rows. The error says why the statement failed; the rows before it
+  // have been delivered. A text of only blanks and comments is not an error.
   Result<void> runFirst(std::string_view& sql, const ColumnsCallback& columns,
                         const RowCallback& row);
 

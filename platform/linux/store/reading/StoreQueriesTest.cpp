@@ -21,8 +21,9 @@ class StoreQueriesTest : public StoreFixture {
     const auto opened = queries.open(options.directory);
     ASSERT_TRUE(opened) << opened.error().message;
   }
-  // Runs the first statement of `sql` and removes it. Returns a line for the names of the columns
-  // and one for each row, with '|' between; the last line is the error, if there is one.
+  // Runs the first statement of `sql` and removes it. Returns one line with the names of the
+  // columns and one line for each row, with '|' between the columns. If there is an error, the last
+  // line is its message.
   std::vector<std::string> lines(std::string_view& sql) {
     std::vector<std::string> result;
     const auto ran = queries.runFirst(

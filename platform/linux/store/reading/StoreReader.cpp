@@ -19,7 +19,7 @@ namespace {
 
 constexpr std::chrono::milliseconds kBusyTimeout{1000};
 
-// Returns a URI that makes SQLite read the file alone, without its log and without locks.
+// Returns a URI that makes SQLite read only the file itself, without its log and without locks.
 std::string immutableURI(const std::string& path) {
   std::string uri = "file:";
   for (const char character : path) {
@@ -46,7 +46,8 @@ Result<void, StoreError> StoreReader::open(const std::filesystem::path& director
         errno == ENOENT || errno == ENOTDIR ? StoreError::kMissing : StoreError::kCannotOpen;
     return Failure<StoreError>{kind, files_->database().native() + ": " + errnoText(errno)};
   }
-  // Opening a pipe would block until a program opens it for writing.
+  // Refuse other files before opening them: opening a pipe would block until a program opens it for
+  // writing.
   if (!S_ISREG(status.st_mode)) {
     return Failure<StoreError>{
         StoreError::kCannotOpen,
@@ -55,8 +56,8 @@ Result<void, StoreError> StoreReader::open(const std::filesystem::path& director
   }
   auto opened = openDatabase();
   if (opened) {
-    // This identity is from before the opening: if another file took the name in between,
-    // isReplaced() notices.
+    // `status` was read before the file was opened. If another file has got the name since,
+    // isReplaced() returns true.
     identity_ = FileIdentity{status.st_dev, status.st_ino};
   } else {
     database_.close();
@@ -70,7 +71,7 @@ Result<void, StoreError> StoreReader::openDatabase() {
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   const std::string& path = files_->database().native();
-  // A service that has just started may have made the file and no table yet.
+  // A service that has just started may have created the file but no table yet.
   if (*version == 0) {
     return Failure<StoreError>{StoreError::kMissing, path + ": nothing has been stored yet"};
   }
@@ -86,14 +87,15 @@ SqliteCode StoreReader::openFile() {
     SqliteCode code = database_.open(file, DatabaseAccess::kReadOnly);
     if (code != SQLITE_OK) return code;
     sqlite3_busy_timeout(database_.get(), static_cast<int>(kBusyTimeout.count()));
-    // SQLite reads the file only when a statement needs it. This statement shows whether it can.
+    // SQLite reads the file only when a statement needs it. This statement shows whether SQLite can
+    // read it.
     return database_.execute("PRAGMA schema_version");
   };
   const std::string& path = files_->database().native();
   const SqliteCode code = attempt(path);
-  // Reading a WAL database needs its -shm file, which a user who may only read cannot create. Such
-  // a user can still read a database that was closed properly: without a log, the file alone is
-  // complete.
+  // Reading a WAL database needs its -shm file, which a user with only the right to read cannot
+  // create. Such a user can still read a database that was closed properly, because without a log
+  // the file itself is complete.
   // The low byte is the primary code; the other bits give details.
   const bool needsLog = (code & 0xFF) == SQLITE_CANTOPEN || (code & 0xFF) == SQLITE_READONLY;
   return needsLog && files_->logBytes() == 0 ? attempt(immutableURI(path)) : code;
@@ -103,7 +105,7 @@ template <typename ReadOld, typename Deliver>
 Result<void, StoreError> StoreReader::forEachMessage(BlockRecordKind kind,
                                                      const RecordFilter& filter, ReadOld old,
                                                      Deliver deliver) {
-  // Read the version for each call: a service may have migrated the store since it was opened.
+  // Read the version at each call. A service may have migrated the store since it was opened.
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   lastRead_ = 0;
@@ -150,7 +152,7 @@ SqliteCode StoreReader::readOldEvents(const RecordFilter& filter, const EventCal
       callback({event.id, event.time, scan.nameOf(event.nameID), piece.payloads[event.payload]});
     }
   }
-  // For an empty table last() is 1, which is also the number of a record in a block.
+  // For an empty table last() is 1, which is also the number of the first record in a block.
   if (code == SQLITE_OK && scan.last() > 1) lastRead_ = scan.last();
   return code;
 }
@@ -159,7 +161,7 @@ Result<void, StoreError> StoreReader::forEachRecord(const RecordTable& table,
                                                     const RecordFilter& filter,
                                                     const RecordCallback& callback) {
   if (!database_.isOpen()) return Failure<StoreError>{StoreError::kMissing, "no store is open"};
-  // A store from an older service lacks the table and has no such records.
+  // If an older service made the store, it may lack the table and has no such records then.
   const auto rows = [&](const RecordFilter& before, std::int64_t version) {
     return version < table.sinceVersion ? SQLITE_OK : readRows(table, before, callback);
   };
@@ -168,7 +170,7 @@ Result<void, StoreError> StoreReader::forEachRecord(const RecordTable& table,
         BlockRecordKind::kLink, filter, rows,
         [&](StoredRecordID id, const BlockRecord& record) { callback(linkRecord(id, record)); });
   }
-  // Read the version for each call: a service may have migrated the store since it was opened.
+  // Read the version at each call. A service may have migrated the store since it was opened.
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   lastRead_ = 0;

@@ -18,11 +18,11 @@
 
 namespace halvox::platform::linux_ {
 
-// The position of a record among those of its kind, in the order of storing. IDs only grow and may
-// have gaps. They start again from 1 when a new database takes the place of the old one.
+// The position of a record among the records of its kind, in the order of storing. IDs only grow
+// and may have gaps. They start again from 1 when a new database replaces the old one.
 using StoredRecordID = std::int64_t;
 
-// Selects the records that have one of the numbers in a column.
+// Selects the records that have one of these numbers in a column.
 struct NumberMatch {
   std::size_t column;  // index into RecordTable::columns
   std::vector<std::int64_t> numbers;
@@ -86,13 +86,13 @@ struct RecordFilter {
   StoredRecordID after = 0;               // only records stored after this one
   std::optional<std::uint64_t> newest{};  // at most this many, the newest
   std::vector<NumberMatch> numbers{};     // all must match; events ignore them
-  // A further condition; events ignore it. It is called only for records that meet all others.
+  // A further condition, called only for records that meet all others. Events ignore it.
   std::function<bool(const StoredRecord&)> accepts{};
 };
 
 // Reads a store without changing it, whether or not a service writes to it at the same time.
-// Belongs to one thread and one owner. Errors are returned; the reader can be opened again after
-// any of them.
+// Belongs to one thread and one owner. Returns errors. After any error the reader can be opened
+// again.
 //
 // Reads in pieces and holds no lock and no snapshot while a callback runs. A snapshot would keep
 // the service from reusing its write-ahead log, and a slow reader would make the log grow.
@@ -102,35 +102,36 @@ class StoreReader {
   using RecordCallback = std::function<void(const StoredRecord&)>;
   using ItemCallback = std::function<void(const StoredItem&)>;
 
-  // Opens the store in `directory`, and closes the one that was open. Fails with kMissing when
-  // there is none or nothing was stored yet, kDamaged, kNewerVersion or kCannotOpen.
+  // Opens the store in `directory`, and closes the store that was open before. Fails with kMissing
+  // if there is no store or nothing was stored yet, or with kDamaged, kNewerVersion or kCannotOpen.
   Result<void, StoreError> open(const std::filesystem::path& directory);
 
-  // Calls `callback` on this thread for each event that passes the filter, oldest first in the
-  // order of storing. Delivers what was stored when the call began. Waits up to one second for a
-  // locked database. After an error, the events before it have been delivered.
+  // Calls `callback` on this thread for each event that passes the filter, in the order of storing.
+  // Delivers the events that were stored when the call began. Waits up to one second for a locked
+  // database. If there is an error, the events before it have been delivered.
   Result<void, StoreError> forEachEvent(const RecordFilter& filter, const EventCallback& callback);
-  // Reads the records of another kind in the same way. A store of an older version that lacks the
-  // kind has no such records, which is not an error.
+  // Reads the records of another kind in the same way. If the store has an older version that lacks
+  // the kind, there are no such records, which is not an error.
   Result<void, StoreError> forEachRecord(const RecordTable& table, const RecordFilter& filter,
                                          const RecordCallback& callback);
 
   // Calls `callback` on this thread for each record of several kinds within a range of time. Events
   // and link messages come in the order of storing; the other kinds are merged with them by time.
-  // Of the filter only the times count. lastRead() does not change. Memory does not grow with the
+  // Uses only the times of the filter. Does not change lastRead(). Memory does not grow with the
   // store.
   Result<void, StoreError> forEachItem(const StoredKinds& kinds, const RecordFilter& filter,
                                        const ItemCallback& callback);
 
-  // The last record that the last complete reading looked at, whether the filter let it through or
-  // not. A reading that continues after it misses no record.
+  // Returns the last record that the last successful call of forEachEvent() or forEachRecord()
+  // looked at, whether or not it passed the filter. A call that continues after that record misses
+  // none.
   [[nodiscard]] StoredRecordID lastRead() const { return lastRead_; }
 
-  // Returns true when no store is open, or the path now leads to another database or to none. Call
-  // open() again; record IDs may then start from 1.
+  // Returns true if no store is open, or if the path leads to another database or to none now. Then
+  // call open() again. Record IDs may start from 1.
   [[nodiscard]] bool isReplaced() const;
 
-  // The connection to the open store, for questions that are not about records.
+  // Returns the connection to the open store, for other queries than reading records.
   [[nodiscard]] Database& database() { return database_; }
 
  private:

@@ -16,8 +16,8 @@ using ::testing::SizeIs;
 
 class StoreReaderTest : public StoreFixture {
  protected:
-  // Stores events 0 to count - 1 at intervals of one second from time 1,000 on, named "even" or
-  // "odd".
+  // Stores events 0 to count - 1, named "even" or "odd". Their times begin at 1,000 and are one
+  // second apart.
   void store1000(std::int64_t count) {
     start();
     for (std::int64_t number = 0; number < count; ++number) {
