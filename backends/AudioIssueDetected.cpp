@@ -33,7 +33,7 @@ AudioIssueDetected::AudioIssueDetected(AudioIssueDetected&& other) noexcept
 
 AudioIssueDetected& AudioIssueDetected::operator=(const AudioIssueDetected& other) {
   if (this == &other) return *this;
-  // Copies before it changes anything: an allocation that fails leaves this message as it was.
+  // Copies before it changes anything. If an allocation fails, this message is as it was.
   AudioIssueDetected copy(other);
   swap(*this, copy);
   return *this;
@@ -100,7 +100,7 @@ bool AudioIssueDetected::readField(ProtoReader& reader, std::uint64_t number,
 
 void AudioIssueDetected::writeTo(ProtoWriter& writer) const {
   if (const auto present = timestamp()) writer.writeUInt64(*present, kTimestamp);
-  // These are written even when they are zero or empty; this is required.
+  // These fields are written even when they are zero or empty; this is required.
   writer.writeInt32(duration_, kDuration);
   writer.writeString(issueType_, kIssueType);
   writer.writeString(node_, kNode);
@@ -109,7 +109,7 @@ void AudioIssueDetected::writeTo(ProtoWriter& writer) const {
 
 void AudioIssueDetected::formatText(ProtoTextFormatter& formatter, const char* name) const {
   formatter.beginObject(name);
-  // In alphabetical order, not in that of the numbers; this is required.
+  // The fields are in alphabetical order, not in the order of their numbers; this is required.
   formatter.format("duration", duration_);
   formatter.format("issuetype", issueType_);
   formatter.format("node", node_);

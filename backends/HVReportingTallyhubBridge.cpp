@@ -19,8 +19,8 @@ using platform::Message;
 
 namespace {
 
-// Joins the parts of an event name without an allocation: every message makes two names, and most
-// of them are only tested, never sent.
+// Joins the parts of an event name without an allocation, because every message makes two names and
+// most of them are only tested, never sent.
 class EventName {
  public:
   EventName(std::initializer_list<std::string_view> parts) {
@@ -39,11 +39,11 @@ class EventName {
 
 Dictionary makePayload(const Message& message, const HVReportingSession& session) {
   static const Key key("HostApplicationDisplayID");
-  // A copy shares the message's entries until it is changed: every bridge and session has the same
-  // message.
+  // A copy that shares the message's entries until it is changed, because every bridge and session
+  // has the same message.
   Dictionary payload = message.value_or(Dictionary{});
-  // Replaces what the message itself has under this key: only the session's configuration counts.
-  // This is required.
+  // Replaces what the message itself has under this key, because only the session's configuration
+  // counts. This is required.
   payload.set(key, HVReportingUtilityRetrieveAppName(session.configuration()));
   return payload;
 }
@@ -69,8 +69,8 @@ void HVReportingTallyhubBridge::handleEvent(const Message& message, AudioEventCa
   const EventName ofAll{"com.tarno.halvox.", categoryText.domain, categoryText.name, ".", typeText};
   const EventName ofService{"com.tarno.",      serviceName, ".",     categoryText.domain,
                             categoryText.name, ".",         typeText};
-  // This order is required. Send nothing between the two: the store keeps consecutive events with
-  // equal payloads as one record.
+  // This order is required. Send nothing between the two, because the store keeps consecutive
+  // events with equal payloads as one record.
   sendIfUsed(ofAll.text(), message, session);
   sendIfUsed(ofService.text(), message, session);
 }

@@ -15,7 +15,7 @@
 // HVReportingUtilityWait blocks. None reports an error: for an unknown value each returns a
 // substitute, which its comment states. Wait, Signal, IsABTestModeOn,
 // ExtractSessionIDFromReporterID and RoundWithPlaces have no caller but their tests. They are
-// required all the same: do not remove them.
+// nevertheless required. Do not remove them.
 namespace halvox {
 
 // --- Texts of the vocabulary --------------------------------------------------------------------
@@ -53,7 +53,8 @@ bool HVReportingUtilityShouldSendMessage();
 bool HVReportingUtilityAllowSessionTransactions();
 // Returns whether the link may batch the messages of a service: all services but kAPIUsage.
 bool HVReportingUtilityShouldBatchTLMReportingEventsForServiceType(AudioServiceType serviceType);
-// Returns whether the category has any bit in its high half. 0xFFFFFFFF is an exception: false.
+// Returns whether the category has any bit in its high half. False for 0xFFFFFFFF, although all its
+// bits are set.
 bool HVReportingUtilityIsABTestModeOn(AudioEventCategory category);
 // Returns the category without its domain.
 std::uint16_t HVReportingUtilityRetrieveTLMReportingCategoryFromCategory(
@@ -97,8 +98,8 @@ platform::Dictionary HVReportingUtilityAddAudioMessageTag(const platform::Dictio
                                                           AudioEventCategory category,
                                                           AudioEventType type);
 // Returns a copy whose keys have "_" in place of each blank (U+0020 only). If two keys become
-// equal, the later value is kept. Without blanks the result shares the input's entries: nothing is
-// copied.
+// equal, the later value is kept. Without blanks the result shares the input's entries, and nothing
+// is copied.
 platform::Dictionary HVReportingUtilityRemoveWhiteSpaceFromKeys(
     const platform::Dictionary& dictionary);
 
@@ -111,8 +112,8 @@ double HVReportingUtilityRoundWithPlaces(double value, std::int32_t places);
 // text has at most `fractionDigits` fraction digits, rounded half to even, and at least one unless
 // `fractionDigits` is 0.
 //
-// The buckets must be sorted, in either direction: the search stops at the first bucket that is
-// farther away than the one before. Of two equally near buckets the later is chosen.
+// The buckets must be sorted, in either direction, because the search stops at the first bucket
+// that is farther away than the one before. Of two equally near buckets the later is chosen.
 std::optional<std::string> HVReportingUtilityBucketNumberToString(
     const platform::Value& number, const platform::Array& buckets,
     const platform::Value& fractionDigits);
@@ -125,9 +126,9 @@ struct HVReportingUtilityCondition {
   std::condition_variable condition;
 };
 
-// Blocks until the flag is set. Returns false on a time-out. Each wake-up restarts the time-out, so
-// a spurious wake-up grants a full one, which is required. Logs to `logCategory`: `waitingMessage`
-// and "continuing" at info level, `timeoutMessage` at error level.
+// Blocks until the flag is set. Returns false on a time-out. Each wake-up restarts the time-out,
+// even a spurious one; this is required. Logs to `logCategory`: `waitingMessage` and "continuing"
+// at info level, `timeoutMessage` at error level.
 bool HVReportingUtilityWait(HVReportingUtilityCondition& condition, double timeoutSeconds,
                             const bool* flag, std::string_view waitingMessage,
                             std::string_view timeoutMessage, platform::LogCategory& logCategory);

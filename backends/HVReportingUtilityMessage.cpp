@@ -11,7 +11,7 @@ using platform::Value;
 platform::Value HVReportingUtilityRetrieveAppName(const Dictionary& dictionary) {
   static const Key key("HostApplicationDisplayID");
   const Value* name = dictionary.find(key);
-  // Any kind of value is returned unchanged: clients may put a number there.
+  // A value of any kind is returned unchanged, because clients may put a number there.
   return name == nullptr ? Value("Unknown") : *name;
 }
 
@@ -33,7 +33,8 @@ Dictionary HVReportingUtilityAddAudioMessageTag(const Dictionary& dictionary,
 
 Dictionary HVReportingUtilityRemoveWhiteSpaceFromKeys(const Dictionary& dictionary) {
   const auto hasBlank = [](const Dictionary::Entry& entry) { return entry.key.hasBlank(); };
-  // Nearly every message takes this way out: a key remembers whether it has a blank.
+  // Nearly every message returns here. The test is cheap, because a key remembers whether it has a
+  // blank.
   if (std::none_of(dictionary.begin(), dictionary.end(), hasBlank)) return dictionary;
 
   Dictionary cleaned;

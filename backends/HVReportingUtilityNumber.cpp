@@ -107,7 +107,8 @@ std::optional<std::string> HVReportingUtilityBucketNumberToString(
   double distance = -1;
   for (const Value& bucket : buckets) {
     const double next = std::fabs(number.toDouble() - bucket.toDouble());
-    // Strictly farther: of two equally near buckets the later one wins.
+    // Stops only at a bucket that is strictly farther away: of two equally near buckets the later
+    // one wins.
     if (distance >= 0 && next > distance) break;
     chosen = &bucket;
     distance = next;

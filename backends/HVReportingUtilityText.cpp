@@ -79,8 +79,8 @@ std::string_view domainText(AudioEventCategory domain) {
 HVReportingCategoryText HVReportingUtilityCategoryTextParts(AudioEventCategory category) {
   const auto value = static_cast<std::uint32_t>(category);
   const std::uint32_t low = value & kLowHalf;
-  // The "_" of a category whose high half is not exactly one domain is required: it shows that
-  // there was something.
+  // The "_" of a category whose high half is not exactly one domain is required. It shows that the
+  // high half was not empty.
   return {hasHighHalf(category) ? domainText(static_cast<AudioEventCategory>(value & kHighHalf))
                                 : std::string_view{},
           kCategoryNames[low < kCategoryNames.size() ? low : 0]};

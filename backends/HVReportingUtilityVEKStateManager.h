@@ -27,7 +27,7 @@ class HVReportingSession;
 //   nothing counted --first report--> one counted --another report--> snapshot, nothing counted
 //
 // Each property may be read and written on any thread. handleEvent() must be called on one serial
-// queue: it holds no lock between reading the state and changing it. Owned by the service's
+// queue, because it holds no lock between reading the state and changing it. Owned by the service's
 // delegate. Returns no error: the outcome of a snapshot is only logged.
 class HVReportingUtilityVEKStateManager {
  public:

@@ -29,7 +29,7 @@ bool HVReportingUtilityWait(HVReportingUtilityCondition& condition, double timeo
   std::unique_lock lock(condition.mutex);
   while (!*flag) {
     UnitLog::logTo(logCategory, kUnit, LogLevel::kInfo, "", waitingMessage);
-    // Computed again on each turn: a wake-up restarts the time-out, which is required.
+    // Computed again on each turn, because a wake-up must restart the time-out. This is required.
     const auto timeout = boundedTimeout(timeoutSeconds);
     if (condition.condition.wait_for(lock, timeout) == std::cv_status::timeout) {
       UnitLog::logTo(logCategory, kUnit, LogLevel::kError, "", timeoutMessage);

@@ -36,7 +36,8 @@ class HVReportingUtilityWaitTest : public testing::Test {
     }
     return false;
   }
-  // Causes a spurious wake-up. Takes the lock first: the waiter releases it only while it waits.
+  // Causes a spurious wake-up. Takes the lock first, because the waiter releases the lock only
+  // while it waits.
   void wakeForNothing() {
     const std::lock_guard lock(condition_.mutex);
     condition_.condition.notify_one();

@@ -12,7 +12,7 @@ platform::LogCategory& makeCategory(std::string_view name) {
 
 }  // namespace
 
-// Static: made on first use and kept for the life of the process; this is required.
+// The category is made on first use and kept for the life of the process; this is required.
 platform::LogCategory& HVReportingClientCategory() {
   static platform::LogCategory& category = makeCategory("hvrc");
   return category;

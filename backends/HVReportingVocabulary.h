@@ -94,8 +94,8 @@ enum class AudioServiceType : std::uint16_t {
 inline constexpr std::string_view kHVReportingLogSubsystem = "com.tarno.halvox";
 
 // The log categories of the components. Each is created on first use and lives as long as the
-// process. Any thread may call. Nothing logs to HVReportingClientCategory; it is required all the
-// same.
+// process. Any thread may call. Nothing logs to HVReportingClientCategory; it is nevertheless
+// required.
 platform::LogCategory& HVReportingClientCategory();
 platform::LogCategory& HVReportingServiceDelegateCategory();
 platform::LogCategory& HVReportingSessionCategory();

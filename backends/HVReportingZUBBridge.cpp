@@ -79,7 +79,8 @@ void HVReportingZUBBridge::handleEvent(const platform::Message& message,
                                        const IssueMetricCounters& counters) {
   if (type != AudioEventType::kIssueDetector || !message.has_value()) return;
   counters.received.add();
-  // Posted even if all keys are missing: that a client saw an issue counts.
+  // The metric is posted even if all keys are missing, because it still says that a client saw an
+  // issue.
   platform::metrics().postIssueMetric(kAudioIssueDetectedMetricID, makeMetric(*message));
   counters.delivered.add();
 }

@@ -105,7 +105,7 @@ class AbsentDiagnosticReporters final : public DiagnosticReporterService {
   void setStateSource(StateSource) override {}
 };
 
-// A file that cannot be committed: no disk is measured.
+// A file that cannot be committed, because no disk is to be measured.
 class AbsentJsonArrayFile final : public JsonArrayFile {
  public:
   void appendObject(std::string_view, const Dictionary&) override {}

@@ -139,7 +139,7 @@ void measureQueue(const Sampler& sampler, const std::filesystem::path& directory
       sessions.push_back(sampler.snapShot());
       snapShots.push_back(milliseconds(Clock::now() - start));
     }
-    // All files change: the first report has to read them again.
+    // All files change, so that the first report has to read them again.
     writeFiles(directory, round + 2);
     for (const SnapShot& session : sessions) {
       const auto start = Clock::now();
@@ -200,7 +200,7 @@ void measureTimes(const Sampler& sampler, const std::filesystem::path& directory
 
 int main(int argc, char** argv) {
   const bool isOfMemory = argc > 1 && std::string_view(argv[1]) == "memory";
-  // One arena for all threads: mallinfo2() must count the memory of all.
+  // All threads share one arena, because mallinfo2() must count the memory of all of them.
   if (isOfMemory) mallopt(M_ARENA_MAX, 1);
   std::string name = (std::filesystem::temp_directory_path() / "halvox-bench-XXXXXX").string();
   if (mkdtemp(name.data()) == nullptr) return 1;

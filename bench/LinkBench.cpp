@@ -84,7 +84,8 @@ double measureLibrary(jsCtx* context, const std::string& body, std::size_t messa
   const auto began = Clock::now();
   for (std::size_t number = 0; number < messages; ++number) {
     char id[40];
-    // An identifier of its own for each message: the server drops those that it has seen.
+    // Each message has an identifier of its own, because the server drops messages whose identifier
+    // it has seen.
     std::snprintf(id, sizeof id, "plain%011d-%zu", round, number);
     options.MsgId = id;
     if (js_PublishAsync(context, "halvox.playback_session.1", body.data(),

@@ -28,7 +28,7 @@ namespace halvox::bench {
 
 // Platform services that cost as little as possible, so that a benchmark measures the inner ring
 // alone. No event, trace or log line is wanted. Queued jobs wait in one list until the benchmark
-// runs them. For one thread.
+// runs them. Belongs to one thread.
 
 class NullAnalytics final : public platform::AnalyticsService {
  public:
@@ -74,7 +74,8 @@ class ListQueue final : public platform::DispatchQueue {
   void async(platform::JobWeight /*weight*/, platform::Job job) override {
     jobs_.push_back(std::move(job));
   }
-  // Does not wait: no measured code signals the semaphore. Continues at the queue's next turn.
+  // Does not wait, because no measured code signals the semaphore. Continues at the queue's next
+  // turn.
   void waitOn(std::shared_ptr<platform::DispatchSemaphore> /*semaphore*/,
               std::optional<std::chrono::nanoseconds> /*timeout*/,
               std::function<void(platform::WaitOutcome)> then) override {
@@ -211,7 +212,8 @@ struct NullPlatform {
   NullLog log;
   NullProcess process;
   MapStatistics statistics;
-  // The real one: without it, a long history would lose messages and cost less than in the service.
+  // The real service. Without it, a long history would lose messages and cost less than in the
+  // service.
   platform::linux_::FileOverflowService overflow{
       {.directory = std::filesystem::temp_directory_path()}, statistics};
 };

@@ -125,11 +125,11 @@ function(halvox_program name)
   halvox_tidy(${name})
 endfunction()
 
-# halvox_module(<file> SOURCES <files> [PARTS <targets>] [DEPENDS <targets>])
-# A library of that file name which the programs load when they need it, beside them in the build and
-# in the library directory when installed. It holds its sources and the objects of PARTS. What these
-# use of our other libraries is not linked again: the module finds it in the program. State that must
-# exist once in a process, such as the installed services, therefore exists once.
+# halvox_module(<file> SOURCES <files> [PARTS <targets>] [DEPENDS <targets>]) A library of that file
+# name which the programs load when they need it. In the build it is in the directory of the
+# programs; when installed, in the library directory. It holds its sources and the objects of PARTS.
+# What these use of our other libraries is not linked again: the module finds it in the program.
+# State that must exist once in a process, such as the installed services, therefore exists once.
 function(halvox_module file)
   cmake_parse_arguments(ARG "" "" "SOURCES;PARTS;DEPENDS" ${ARGN})
   list(TRANSFORM ARG_PARTS REPLACE "(.+)" "$<TARGET_OBJECTS:\\1>" OUTPUT_VARIABLE objects)

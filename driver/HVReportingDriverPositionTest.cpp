@@ -27,7 +27,7 @@ class HVReportingDriverPositionTest : public DriverUtilityFixture,
     }
     return subscribed;
   }
-  // The groups that do not fail, each after these words.
+  // The names of the groups that do not fail, each with these words in front.
   static Texts othersAfter(std::string_view words) {
     Texts texts;
     for (const char* group : kGroups) {

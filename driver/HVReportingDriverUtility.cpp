@@ -159,7 +159,8 @@ void HVReportingDriverUtility::subscribe(const HVReportingDriver& driver) {
 
 DriverSnapShot HVReportingDriverUtility::getSnapShot() const {
   DriverSnapShot snapShot;
-  // One moment for all groups: the drivers are read once, after the session has started.
+  // All groups share one moment. The drivers are therefore read once, after the session has
+  // started.
   const auto moment = platform::ioReport().makeMoment();
   for (const auto& subscription : ioChannelSubscriptions_) {
     std::string description = subscription.driver().description();
@@ -178,8 +179,8 @@ void HVReportingDriverUtility::sendDriverLogsForSession(
     const std::shared_ptr<HVReportingSession>& session) const {
   Stats stats;
   const auto snapShot = session->driverSnapShot();
-  // One moment for all groups here too: with a reading for each group, the median of a report was
-  // 0.98 ms with 500 channels.
+  // All groups share one moment here too. With a reading for each group, the median time of a
+  // report was 0.98 ms with 500 channels.
   const auto moment = platform::ioReport().makeMoment();
   for (const auto& subscription : ioChannelSubscriptions_) {
     kDriverLog.info("getting latest samples");
@@ -263,7 +264,7 @@ void HVReportingDriverUtility::processStateData(const IOReportChannel& channel,
             ",duty_cycle:" + std::to_string(IOReportStateGetDutyCycle(channel, index)) + ";";
   }
   kDriverLog.debug("the current reported data is : ", text);
-  // Reported even if the text is empty: the receiver sees that the channel exists.
+  // Reported even if the text is empty, so that the receiver sees that the channel exists.
   driverStats.set(platform::Key(getDriverStatsKey(channel, kStateType)), text);
 }
 

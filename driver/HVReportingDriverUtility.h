@@ -31,7 +31,8 @@ class HVReportingDriverUtility {
 
   HVReportingDriverUtility();
 
-  // In the order of the fixed list; only the groups that had channels and could be subscribed to.
+  // The subscriptions in the order of the fixed list. Groups that had no channels or could not be
+  // subscribed to are missing.
   [[nodiscard]] const std::vector<HVReportingIOChannelSubscription>& ioChannelSubscriptions()
       const {
     return ioChannelSubscriptions_;

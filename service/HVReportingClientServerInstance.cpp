@@ -103,7 +103,8 @@ void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
 }
 
 // The I/O thread may run the brief requests itself. Starts, stops and destroys are not brief: they
-// can wait for the drivers, a trace or a file, and would hold up every connection meanwhile.
+// can wait for the drivers, a trace or a file, and on the I/O thread they would delay every
+// connection meanwhile.
 template <typename Member, typename Reply>
 void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
                                                    RequestContext&& context, Member carryOut,
@@ -207,8 +208,8 @@ void HVReportingClientServerInstance::endOfRequests() {
 void HVReportingClientServerInstance::carryOutSends(Messages& messages) {
   std::exception_ptr failure;
   for (MessageRequest& message : messages) {
-    // Moved out of the list, to be released as soon as it is sent: the client's next requests are
-    // read only while few requests are open.
+    // Moved out of the list, so that the request is released as soon as its message is sent. The
+    // client's next requests are read only while few requests are open.
     MessageRequest request = std::move(message);
     try {
       carryOutSend(request);
@@ -230,7 +231,7 @@ void HVReportingClientServerInstance::carryOutSends(Messages& messages) {
 
 Guarded<std::vector<HVReportingClientServerInstance::Messages>>&
 HVReportingClientServerInstance::spareMessages() {
-  // Never destroyed: connections may still have work while the process exits.
+  // Never destroyed, because connections may still have work while the process exits.
   static auto* const spares = new Guarded<std::vector<Messages>>;
   return *spares;
 }

@@ -104,8 +104,8 @@ class HVReportingClientServerInstance final
   };
   // Messages that one job sends.
   using Messages = std::vector<MessageRequest>;
-  // Empty lists with reserved room, for any client. They belong to the process: a client must not
-  // keep memory because it once sent much.
+  // Empty lists with reserved room, for any client. They belong to the process, because a client
+  // that once sent much must not keep memory for ever.
   static Guarded<std::vector<Messages>>& spareMessages();
 
   // Queues `work`, which is called with this client, on the reporting queue. Keeps the client and
@@ -146,8 +146,8 @@ class HVReportingClientServerInstance final
   void handToBackEnds(const MessageRequest& request, const Session& session,
                       const Delegate& delegate) const;
 
-  // All changes of the map and of its sessions' states go through these: they keep the delegate's
-  // index and the client's account up to date.
+  // All changes of the map and of its sessions' states go through these functions, which keep the
+  // delegate's index and the client's account up to date.
   void putSession(const Session& session, const Delegate& delegate);
   void removeSession(SessionMap::iterator place, const Delegate& delegate);
   void note(const Session& session, SessionChange change, const Delegate& delegate) const;

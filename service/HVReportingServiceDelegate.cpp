@@ -53,8 +53,8 @@ void sendUptimeEvent(const std::string& processName, const platform::Value& upti
   });
 }
 
-// The connection has ended and will not return. Runs on the connection's thread: reads only the
-// thread-safe properties of the client.
+// The connection has ended and will not return. Runs on the connection's thread, and therefore
+// reads only the thread-safe properties of the client.
 void handleInvalidation(const WeakClient& weakClient, platform::ProcessID pid) {
   handleConnectionError(weakClient);
   const auto client = weakClient.lock();

@@ -28,7 +28,7 @@ class HVReportingServiceDriversTest : public ServiceFixture {
                                                     .integerValue = cycles}});
   }
   Texts operations() const { return platform_.journal.texts(JournalKind::kNote); }
-  // Those of the given steps that happened, in their order.
+  // The given steps that happened, in the order in which they happened.
   Texts order(const std::vector<std::string_view>& named) const {
     Texts found;
     for (const std::string& step : steps()) {

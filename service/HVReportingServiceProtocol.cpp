@@ -96,7 +96,7 @@ void invokeStart(ExportedObject& object, Invocation&& request) {
                                              std::move(request.context));
 }
 
-// Lets the connection layer refuse a message that names too many before its IDs are copied.
+// Lets the connection layer refuse a message with too many reporter IDs before the IDs are copied.
 std::size_t countReporterIDs(std::span<const Value> arguments) {
   const Array lists = arguments[3].array();
   return lists.empty() ? 0 : lists[0].array().size();

@@ -8,7 +8,7 @@
 namespace halvox {
 namespace {
 
-// ASCII only: the comparison must not depend on the locale.
+// Converts ASCII letters only, because the comparison must not depend on the locale.
 constexpr char lower(char letter) {
   return letter >= 'A' && letter <= 'Z' ? static_cast<char>(letter - 'A' + 'a') : letter;
 }

@@ -9,7 +9,7 @@ namespace {
 using SharedQueue = Guarded<std::shared_ptr<platform::DispatchQueue>>;
 
 SharedQueue& slot() {
-  // Never destroyed: connections may still queue work while the process exits.
+  // Never destroyed, because connections may still queue work while the process exits.
   static auto* queue = new SharedQueue;
   return *queue;
 }

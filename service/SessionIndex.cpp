@@ -7,7 +7,7 @@
 namespace halvox {
 
 void SessionIndex::addClient(const Client& client) {
-  // Places are never reused: a client that reconnects comes after all others.
+  // Places are never reused, because a client that reconnects must come after all others.
   places_.emplace(&client, static_cast<Place>(++placesGiven_));
 }
 

@@ -53,7 +53,8 @@ std::string HVReportingSession::description() const {
   return text;
 }
 
-// Appends instead of returning a text: the lines that list all sessions describe many of them.
+// Appends instead of returning a text, because the lines that list all sessions describe many of
+// them.
 void HVReportingSession::appendDescription(std::string& text) const {
   text += "reporterID=";
   text += std::to_string(number(reporterID()));

@@ -20,7 +20,7 @@ namespace halvox {
 
 // Message keys offered to clients. The service reads neither, and this is required: no field is
 // excluded from comparisons and no message is throttled. The established names begin with "_HV",
-// which C++ reserves for itself, so these begin with k.
+// which C++ reserves for itself. These therefore begin with k.
 inline constexpr std::string_view kHVReportingSessionBlacklistFieldsKey =
     "_comparison_field_blacklist";
 inline constexpr std::string_view kHVReportingSessionThrottleSecondsKey = "_throttle_seconds";
@@ -32,8 +32,9 @@ inline constexpr std::string_view kHVReportingSessionThrottleSecondsKey = "_thro
 //   any state --last reference released--> destroyed, without being stopped
 //
 // The client's connection object owns it and drives it on the reporting queue. Jobs and analytics
-// payloads that need the session share it: it is always held by a shared pointer. The properties
-// may be read and written from any thread; each access is indivisible. No operation fails.
+// payloads that need the session share it. Therefore it is always held by a shared pointer. The
+// properties may be read and written from any thread; each access is indivisible. No operation
+// fails.
 //
 // Each concern is a member: the profile (what the session is), the history (what it recorded), the
 // link (where messages go), the summary (what a stop reports) and the traces of test sessions.
@@ -170,7 +171,7 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   void sendSummaryEvent();
   void count(SessionHistory::Outcome outcome) const;
 
-  // Members that others refer to come first: destruction runs backwards.
+  // Members that others refer to come first, because destruction runs backwards.
   const Counters counters_;
   ResourceTally held_;
   SessionProfile profile_;

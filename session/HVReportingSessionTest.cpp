@@ -394,7 +394,7 @@ TEST_F(HVReportingSessionTest, StartSetsTheFlagBeforeItMakesTheHistory) {
   EXPECT_TRUE(session->nestedAggregatedPayloadData()->has_value());
 }
 
-// For ThreadSanitizer: other threads build payloads from sessions.
+// Checked by ThreadSanitizer: other threads build payloads from sessions.
 TEST_F(HVReportingSessionTest, PropertiesMayBeReadWhileTheyAreWritten) {
   const auto session = makeSession();
   platform_.log.setLevel(LogLevel::kError);

@@ -25,8 +25,8 @@ class LinkDiscovery {
   using Backends = std::optional<platform::Array>;
   using Report = std::function<void(const Backends&)>;
 
-  // `report` is called at most once, never on the link's queue. It must not keep the session alive:
-  // the framework may hold this object for ever.
+  // `report` is called at most once, never on the link's queue. `report` must not keep the session
+  // alive, because the framework may hold this object for ever.
   explicit LinkDiscovery(Report report) : report_(std::move(report)) {}
 
   // Call once, from the start job, after it has logged that it waits.

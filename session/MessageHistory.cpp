@@ -296,8 +296,8 @@ std::uint64_t& MessageHistory::Reader::countOf(const Base& base) {
 
 bool equalApartFromVolatileKeys(const Dictionary& left, const Dictionary& right) {
   if (left.isIdenticalTo(right)) return true;
-  // Repeated messages nearly always have the same keys in the same order: this loop needs no
-  // look-up.
+  // Repeated messages nearly always have the same keys in the same order. This loop compares them
+  // without a look-up.
   if (left.size() == right.size()) {
     const Dictionary::Entry* other = right.begin();
     const Dictionary::Entry* entry = left.begin();

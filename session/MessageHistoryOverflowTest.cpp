@@ -120,7 +120,7 @@ TEST_F(MessageHistoryOverflowTest, TheEndGivesTheRoomBack) {
   EXPECT_EQ(account_->use().bytes, 0U);
 }
 
-// Many sessions of one client: each is small, together they are not.
+// Each of many sessions of one client is small, but together they are large.
 TEST_F(MessageHistoryOverflowTest, AClientOverItsShareMovesEvenShortHistories) {
   platform_.overflow.setMemoryPerClient(100'000);
   ResourceTally tally;

@@ -81,7 +81,8 @@ class ResourceTally {
   // Call when something that the session holds has changed its size from `before` to `after` bytes.
   void change(std::size_t before, std::size_t after) {
     if (account_ == nullptr) return;
-    // Unsigned: if less is held now, the difference wraps and adding it subtracts.
+    // The numbers are unsigned: if less is held now, the difference wraps around, and adding it
+    // subtracts.
     const std::size_t difference = after - before;
     // The usual case: most messages fit into memory that the history has already reserved.
     if (difference == 0) return;

@@ -71,7 +71,7 @@ class SessionLink {
   // Flushes what the framework still holds and closes the link.
   void submitStop(const Owner& owner);
 
-  // Both are created on the first call: most sessions of a busy service have no link.
+  // Both are created on the first call, because most sessions of a busy service have no link.
   [[nodiscard]] const std::shared_ptr<platform::DispatchQueue>& tlmReportingQueue();
   // Receives one signal for each answer of the framework about back-ends.
   [[nodiscard]] const std::shared_ptr<platform::DispatchSemaphore>& tlmreportingBackendSemaphore();

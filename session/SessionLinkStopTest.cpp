@@ -157,7 +157,7 @@ TEST_F(SessionLinkStopTest, TheLastJobKeepsTheSessionUntilItIsFlushed) {
   EXPECT_TRUE(session.expired());
 }
 
-// For ThreadSanitizer: the discovery answers on a thread of the framework.
+// Checked by ThreadSanitizer: the discovery answers on a thread of the framework.
 TEST_F(SessionLinkStopTest, DiscoveryMayAnswerOnAnotherThread) {
   holdDiscoveries();
   start();

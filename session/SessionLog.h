@@ -18,7 +18,7 @@ constexpr std::int64_t number(ReporterID reporterID) {
 constexpr std::uint16_t number(AudioServiceType serviceType) {
   return static_cast<std::uint16_t>(serviceType);
 }
-// Signed: tools expect categories in this form.
+// A signed number, because tools expect categories in this form.
 constexpr std::int32_t number(AudioEventCategory category) {
   return static_cast<std::int32_t>(category);
 }

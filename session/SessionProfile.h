@@ -45,7 +45,7 @@ class SessionProfile {
   void mergeConfiguration(const platform::Dictionary& configuration);
 
  private:
-  // Never changes: maps are keyed by it.
+  // Never changes, because maps are keyed by it.
   const ReporterID reporterID_;
   ResourceTally& held_;  // the session's
   Guarded<ProcessIdentifiers> processIdentifiers_;

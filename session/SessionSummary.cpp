@@ -38,7 +38,7 @@ void SessionSummary::sendVolumeMessages(const Send& send) const {
     }
     return walk->next();
   };
-  // Logged once, before the first message, and only if there is one.
+  // The line is logged once, before the first message, and only if there is a message.
   Message message = next();
   if (!message.has_value()) return;
   kSessionLog.notice("sending volume event for reporter ", number(profile_.reporterID()));

@@ -8,8 +8,8 @@
 
 #include "session/SummaryFixture.h"
 
-// The summary files of internal builds. A program of its own: a process queries only once whether
-// this is an internal build.
+// The summary files of internal builds. They are in a program of their own, because a process
+// queries only once whether this is an internal build.
 namespace halvox {
 namespace {
 

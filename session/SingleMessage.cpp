@@ -86,9 +86,9 @@ void sendNow(const SingleMessage& single, const ErrorReply& reply,
 }  // namespace
 
 // The number of waiting messages has no bound of its own. A message that arrives here was already
-// answered and must not be dropped. A bound of 32 MiB for all clients was tried: 60 messages of
-// 1 MiB from one client made it drop all 10 messages of another. Now the sender's account bounds
-// them: over its limit, the sender's next requests are refused.
+// answered and must not be dropped. A bound of 32 MiB for all clients was tried: 60 messages of 1
+// MiB from one client made it drop all 10 messages of another. Now the sender's account bounds
+// them: while it is over its limit, the sender's next messages are refused.
 void submitSingleMessage(SingleMessage single, ErrorReply reply,
                          const std::shared_ptr<ResourceAccount>& sender,
                          const SessionCounters::SingleMessages& counters) {

@@ -42,8 +42,8 @@ class SummaryEvent {
 
   std::vector<Column> columns_;
   std::unordered_map<platform::Key, std::size_t, KeyHash> positions_;
-  // The column after the last one used. Messages of one kind have the same keys in the same order,
-  // so it is usually the next one needed and saves a look-up.
+  // The column after the last one used. Messages of one kind have the same keys in the same order.
+  // This column is therefore usually the next one that is needed, which saves a look-up.
   std::size_t likely_ = 0;
 };
 

@@ -24,7 +24,7 @@ using testing::SizeIs;
 
 class VolumeMessagesTest : public testing::Test {
  protected:
-  // A message which says that a client plays, or is silent, at this volume and time.
+  // Adds a message in which a client plays, or is silent, at this volume and time.
   void playing(const Value& volume, double stamp) { volumeMessage(volume, 1, stamp); }
   void silent(const Value& volume, double stamp) { volumeMessage(volume, 0, stamp); }
   void volumeMessage(const Value& volume, const Value& state, const Value& stamp) {

@@ -73,8 +73,8 @@ void addGroups(CommandSet& commands, CommandSource source) {
   }
 }
 
-// The library shows "[OPTIONS]" before the command in a usage line. A line of a script has no
-// options there.
+// The library's usage line shows options before the command. A line of a script has no options
+// there.
 class HelpFormatter final : public CLI::Formatter {
  public:
   std::string make_usage(const CLI::App* app, std::string name) const override {

@@ -38,8 +38,8 @@ void CommandSet::addCommonOptions(CLI::App& app, CommandReach reach) {
                             "How long to wait for an answer (default: 5)")
                       ->type_name("SECONDS");
   if (reach == CommandReach::kService) return;
-  // All commands accept them, so that a shell alias may contain them. Only the help of commands for
-  // which they matter shows them.
+  // All commands accept these options, so that a shell alias may contain them. Only the help of
+  // commands for which they matter shows them.
   socket->group("");
   timeout->group("");
 }

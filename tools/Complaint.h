@@ -25,7 +25,7 @@ std::string_view failureKind(ExitStatus status);
 
 // Reports the failure of one command: one line on `errors`, and with JSON output also an object on
 // `out`. Escapes characters that could control a terminal, because messages quote files and
-// arguments. One thread.
+// arguments. Belongs to one thread.
 class Complaint {
  public:
   // The streams must outlive it.

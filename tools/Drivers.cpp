@@ -154,7 +154,7 @@ class DriverPrinter {
 
   IOReportService::Samples sample() {
     std::optional<platform::IOReportError> error;
-    // A new moment each time: samples of one moment would have the same values.
+    // Each sample has a moment of its own, because samples of one moment have the same values.
     return service_.IOReportCreateSamples(subscription_, channels_, *service_.makeMoment(), error);
   }
 
@@ -188,8 +188,8 @@ class DriverPrinter {
  private:
   static bool isReadFor(std::chrono::milliseconds time, int descriptor) {
     pollfd output{descriptor, 0, 0};
-    // Requests no events: errors and hang-ups are always reported. This is a pause that ends early
-    // when the reader closes the pipe.
+    // Requests no events, because errors and hang-ups are always reported. This is a pause that
+    // ends early when the reader closes the pipe.
     const int polled = poll(&output, 1, static_cast<int>(time.count()));
     return polled <= 0 || (output.revents & (POLLERR | POLLHUP | POLLNVAL)) == 0;
   }

@@ -127,7 +127,7 @@ TEST_F(EventsTest, TheConfigurationNamesTheStore) {
   unsetenv("HALVOX_CONFIG");
 }
 
-// Follows through a pipe, as another program would: its lines are read at this end.
+// The command writes into a pipe, as for another program, and the test reads its lines.
 TEST_F(EventsTest, FollowingShowsNewEventsUntilTheOutputIsClosed) {
   store("com.a.first", {{"n", 1}});
   const std::string pipePath = scratch_.path("pipe");

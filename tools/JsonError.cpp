@@ -72,7 +72,7 @@ std::string foundIn(std::istream& text) {
   while (character.size() < kLongestCharacter) {
     const int byte = text.peek();
     if (byte == std::istream::traits_type::eof()) break;
-    // A whole character: its first byte alone would be shown as broken text.
+    // Takes a whole character, because its first byte alone would be shown as broken text.
     if (!character.empty() && !platform::linux_::continuesUtf8(static_cast<char>(byte))) break;
     character += static_cast<char>(text.get());
   }

@@ -234,7 +234,7 @@ std::string harmless(std::string_view text, InvalidByte treatment) {
   std::string result;
   result.reserve(text.size());
   while (!text.empty()) {
-    // Texts come from clients and archives: they may hold anything.
+    // Texts come from clients and archives, and may hold anything.
     const auto step = platform::linux_::nextUtf8(text);
     if (step.valid && !isHarmful(step.character)) {
       result += text.substr(0, step.length);
@@ -311,7 +311,7 @@ std::string harmlessText(std::string_view text) { return harmless(text, InvalidB
 std::string fieldsOfJson(std::string_view json) {
   rapidjson::Document document;
   document.Parse<kParseFlags>(json.data(), json.size());
-  // Another text is shown as it is: a person can read more from it than from an error.
+  // Another text is shown as it is, because a person can read more from it than from an error.
   if (document.HasParseError() || !document.IsObject()) return harmlessText(json);
   std::string fields;
   for (const auto& member : std::as_const(document).GetObject()) {

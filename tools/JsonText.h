@@ -24,8 +24,8 @@ std::string toJson(const platform::Value& value);
 // Formats a text as a JSON string with quotes. Bytes that are not UTF-8 become U+FFFD.
 std::string quoted(std::string_view text);
 
-// Escapes the characters of a JSON text that could control a terminal or reorder a line. They occur
-// only inside strings: the meaning stays the same.
+// Escapes the characters of a JSON text that could control a terminal or reorder a line. Such
+// characters occur only inside strings, and escapes do not change the meaning.
 std::string harmlessJson(std::string_view json);
 
 // Makes a text safe to print on one line: control characters become escapes.

@@ -30,7 +30,8 @@ client::EventType typeOf(const StoredRecord& message) {
 std::string tagOf(const StoredRecord& message) {
   const std::string& payload = message.text(store::kLinkPayload);
   rapidjson::Document document;
-  // Iterative: a payload may be nested deeply, and the recursive parser would overflow the stack.
+  // The parser is the iterative one, because a payload may be nested deeply and the recursive
+  // parser would overflow the stack.
   document.Parse<rapidjson::kParseIterativeFlag>(payload.data(), payload.size());
   if (document.HasParseError() || !document.IsObject()) return {};
   if (!document.HasMember(kTag) || !document[kTag].IsString()) return {};

@@ -55,7 +55,7 @@ ExitStatus postNotification(const PostNotification& request, OutputForm form, st
     return complain(ExitStatus::kCannotWrite, directory.native() + ": " + error.message());
   }
   const std::filesystem::path file = directory / request.name;
-  // Not blocking, because the file may be a pipe that nobody reads.
+  // The open does not block, because the file may be a pipe that nobody reads.
   constexpr int kFlags = O_WRONLY | O_CREAT | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
   const UniqueFd descriptor(::open(file.c_str(), kFlags, 0644));
   // Touch a file that exists, so that its time is that of the last post.

@@ -33,7 +33,8 @@ Failure<> failure(const std::filesystem::path& path, int error) {
   return {path.native() + ": " + errnoText(error)};
 }
 
-// A file under a temporary name beside its target. The destructor deletes it unless it was kept.
+// A file under a temporary name in the directory of its target. The destructor deletes it unless it
+// was kept.
 class NewFile {
  public:
   explicit NewFile(const std::filesystem::path& target)
@@ -70,7 +71,7 @@ class NewFile {
 };
 
 mode_t modeOfNewFile() {
-  // The mask cannot be read without setting it: no other thread may create a file meanwhile.
+  // The mask cannot be read without setting it. No other thread may create a file meanwhile.
   const mode_t mask = ::umask(0);
   ::umask(mask);
   return kModeOfNewFiles & ~mask;
@@ -128,7 +129,7 @@ Result<void> changePreferenceFile(const std::filesystem::path& named, const Pref
                      ": another program has locked this directory; try again later"};
   }
 
-  // Read under the lock: the change is made to the text that it will replace.
+  // Read under the lock, because the change must be made to the text that it will replace.
   auto content = readPreferenceText(file);
   if (!content) return std::move(content).error();
   const std::optional<PreferenceText>& old = *content;

@@ -161,7 +161,7 @@ class RequestRunner::Execution {
     return ExitStatus::kDone;
   }
 
-  // For requests that are answered with yes or no: prints nothing after yes.
+  // Reports the answer to a request that is answered with yes or no. Prints nothing after yes.
   ExitStatus report(const char* command, std::optional<ReporterID> id, const Result<bool>& result) {
     if (!result) return complain(command, *result.failure);
     if (!*result.value) {
@@ -195,7 +195,7 @@ class RequestRunner::Execution {
 
 ExitStatus RequestRunner::run(const Request& request, bool json, const std::string& prefix) {
   const char* command = std::visit([](const auto& asked) { return asked.kCommand; }, request);
-  // The first request connects: a script of comments needs no service.
+  // Only the first request connects. A script without requests therefore needs no service.
   if (!connection_) {
     const Complaint complain(command, json ? OutputForm::kJson : OutputForm::kText, out_, errors_);
     const auto socket = namedSocket(options_, complain);
@@ -208,8 +208,8 @@ ExitStatus RequestRunner::run(const Request& request, bool json, const std::stri
   return std::visit(Execution(*this, json, prefix), request);
 }
 
-// Warns of sockets at earlier places on which no service listens: the user may expect one of those
-// services.
+// Warns of sockets at earlier places on which no service listens, because the user may expect a
+// service there.
 void RequestRunner::warnOfUnservedSockets() {
   for (const std::string& path : connection_->unservedSockets()) {
     errors_ << "halvoxctl: no service listens on " << harmlessText(path) << "; using "

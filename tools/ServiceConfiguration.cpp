@@ -75,8 +75,8 @@ std::variant<std::filesystem::path, ExitStatus> findStore(const Complaint& compl
   auto configuration = configurationWith(search, complain);
   if (const auto* status = std::get_if<ExitStatus>(&configuration)) return *status;
   auto& directory = std::get<Configuration>(configuration).storage.directory;
-  // Any other directory was named by the configuration. It is not checked here: the error of the
-  // reader names it.
+  // Any other directory was named by the configuration. That directory is not checked here, because
+  // the error of the reader names it.
   if (search.isThere || directory != search.directory) return std::move(directory);
   return complain(ExitStatus::kNoService, client::describeTried("store", search.tried), "no-store");
 }

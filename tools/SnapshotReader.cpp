@@ -250,7 +250,7 @@ Result<std::vector<std::string>> unpackSnapshot(const fs::path& snapshot, const 
   const fs::path source = fs::absolute(snapshot, error);
   if (error) return failed(snapshot, error.message());
   if (::access(source.c_str(), R_OK) != 0) return failed(snapshot, errnoText(errno));
-  // For this user only, like the snapshots themselves.
+  // Only this user may enter the directory, because only this user may read the snapshots.
   const bool isMade = ::mkdir(directory.c_str(), 0700) == 0;
   if (!isMade && errno != EEXIST) return failed(directory, errnoText(errno));
   auto unpacked = unpack(source, directory, existing);

@@ -60,7 +60,7 @@ std::variant<std::filesystem::path, ExitStatus> storeDirectory(const std::string
   const std::filesystem::path path(database);
   std::error_code ignored;
   if (std::filesystem::is_directory(path, ignored)) return path;
-  // The file may be missing: the reader of the store reports that with its own reason.
+  // The file may be missing. The reader of the store reports that with its own reason.
   if (path.filename() == kDatabaseName) {
     return path.has_parent_path() ? path.parent_path() : std::filesystem::path(".");
   }

@@ -91,7 +91,8 @@ class SummaryHandler {
     return value([&] { return writer_.Bool(flag); });
   }
   bool RawNumber(const char* text, rapidjson::SizeType length, bool /*copy*/) {
-    // Only at the top of the message: a nested dictionary may have a key of the same name.
+    // Only the time stamp at the top of the message counts. A nested dictionary may have a key of
+    // the same name.
     if (depth_ == kInMessage && isTimestamp_) noteTime(std::string(text, length));
     return value([&] { return writer_.RawValue(text, length, rapidjson::kNumberType); });
   }
@@ -196,7 +197,7 @@ struct CloseFile {
 };
 using File = std::unique_ptr<std::FILE, CloseFile>;
 
-// Opens a regular file. Fails for directories and pipes: reading those may never end.
+// Opens a regular file. Fails for directories, and for pipes, which might never end.
 Result<File> openFile(const std::string& path) {
   struct stat status {};
   if (::stat(path.c_str(), &status) != 0) return Failure<>{errnoText(errno)};
@@ -216,7 +217,7 @@ std::optional<SummaryName> parseSummaryName(std::string_view name) {
   name.remove_prefix(kTimePattern.size());
   if (!name.starts_with(kMark)) return std::nullopt;
   name.remove_prefix(kMark.size());
-  // The last hyphen: names of services have none, names of applications may.
+  // The last hyphen is the one before the service, because names of services have no hyphen.
   const std::size_t hyphen = name.rfind('-');
   if (hyphen == std::string_view::npos) return std::nullopt;
   parsed.application = name.substr(0, hyphen);

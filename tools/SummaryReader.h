@@ -26,7 +26,7 @@ std::optional<SummaryName> parseSummaryName(std::string_view name);
 struct SummaryTotals {
   std::uint64_t messages = 0;
   std::uint64_t volumeIntervals = 0;
-  // From the first to the last message with a time stamp; none if there is no time stamp.
+  // The time from the first to the last message with a time stamp; none if there is no time stamp.
   std::optional<double> seconds;
 };
 

@@ -198,8 +198,8 @@ Result<double> parseTime(std::string_view text, double now) {
 
 std::string localTime(double seconds) {
   const double whole = std::floor(seconds);
-  // Rounded down: a time that was rounded up would lie after its record, and --since with it would
-  // skip the record.
+  // Rounded down, because a time that was rounded up would lie after its record, and --since with
+  // this time would skip the record.
   const auto milliseconds = static_cast<int>((seconds - whole) * 1000);
   const auto time = static_cast<std::time_t>(whole);
   std::tm fields{};

@@ -109,7 +109,7 @@ Result<TraceResults> readTraceResults(const std::string& file) {
 TraceStatistics statisticsOf(std::vector<double> values) {
   std::ranges::sort(values);
   const auto atRank = [&](double share) {
-    // The nearest-rank method: every figure is a value that was measured.
+    // This is the nearest-rank method, by which every figure is a value that was measured.
     const auto rank = static_cast<std::size_t>(std::ceil(share * double(values.size())));
     return values[std::max<std::size_t>(rank, 1) - 1];
   };

@@ -33,8 +33,8 @@ ExitStatus showTrace(const ShowTrace& request, OutputForm form, std::ostream& ou
                      std::ostream& errors);
 
 // Writes the intervals of a results file as Trace Event JSON. Each measurement has a track, on
-// which its intervals follow each other: results hold how long intervals took, but not when they
-// began.
+// which its intervals follow each other, because results hold how long intervals took but not when
+// they began.
 ExitStatus exportTrace(const ExportTrace& request, OutputForm form, std::ostream& out,
                        std::ostream& errors);
 

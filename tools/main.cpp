@@ -10,7 +10,7 @@
 int main(int argc, char** argv) {
   // End quietly when the reader closes the output, even if our parent made us ignore SIGPIPE.
   std::signal(SIGPIPE, SIG_DFL);
-  // This program does not mix streams with stdio: they need not be synchronised.
+  // This program does not mix streams with stdio. Therefore they need not be synchronised.
   std::ios::sync_with_stdio(false);
   return static_cast<int>(halvox::tools::runTool(
       std::vector<std::string>(argv + 1, argv + argc),

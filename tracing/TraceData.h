@@ -30,8 +30,8 @@ class TraceData {
   [[nodiscard]] bool hasResults() const { return !results_.empty(); }
   // In the order in which they were found.
   [[nodiscard]] std::vector<std::uint64_t> getResults() const { return results_; }
-  // Sum and division are in single precision, as the interface demands. Without results it is not a
-  // number.
+  // Sum and division are in single precision, as the interface demands. Without results the average
+  // is not a number.
   [[nodiscard]] float getAverageResult() const;
   // The number of measured intervals. The values of a TracePoint leave it at 0.
   [[nodiscard]] std::uint32_t getNumTimesTraced() const { return count_; }

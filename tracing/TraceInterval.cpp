@@ -85,8 +85,8 @@ void TraceInterval::processTracepointsAnyThread(const Session& session, const Ev
 }
 
 void TraceInterval::addInterval(const Session& session, std::uint64_t begin, std::uint64_t end) {
-  // Converts each timestamp before subtracting: the conversion rounds, so converting the difference
-  // would give another result.
+  // Converts each timestamp before subtracting. The conversion rounds, and converting the
+  // difference would therefore give another result.
   const platform::KtraceService& ktrace = platform::ktrace();
   addResult(ktrace.ktrace_convert_timestamp_to_nanoseconds(session, end) -
             ktrace.ktrace_convert_timestamp_to_nanoseconds(session, begin));

@@ -5,7 +5,7 @@
 namespace halvox {
 
 platform::LogCategory& HVReportingTraceCategory() {
-  // Static: made on first use and kept for the life of the process; this is required.
+  // The category is made on first use and kept for the life of the process; this is required.
   static platform::LogCategory& category =
       platform::log().createCategory("com.tarno.halvox", "hvrt");
   return category;

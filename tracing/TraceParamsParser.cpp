@@ -144,7 +144,8 @@ class FileReader {
     if (kind_ == TracePointKind::kInterval) {
       params.endCode = scanHexadecimal(textOf(point, TracePointEndCode));
     }
-    // Reported before an impulse gets its end code: the log line shows the codes of the file.
+    // Reported before an impulse gets its end code, because the log line must show the codes of the
+    // file.
     listener_.onTracePoint(params);
     if (kind_ == TracePointKind::kImpulse) params.endCode = params.beginCode;
     return params;

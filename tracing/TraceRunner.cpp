@@ -179,7 +179,8 @@ void TraceRunner::stopTracingandProcessResults() {
         recording->tracingCompletionHandler();
       }
     });
-    // One at a time: the next trace is ended only when this one has completed; this is required.
+    // Traces are ended one at a time: the next one only after this one has completed. This is
+    // required.
     completions_->signals->wait();
     if (trace.isKernelTrace()) results_[&trace] = trace.getResults();
     kLog.info("Completed trace.... ", completions_->count.load(std::memory_order_relaxed), ",   ",

@@ -7,7 +7,7 @@
 namespace halvox {
 
 // Makes the texts whose hashes are in string_hashes.txt, one a line: arbitrary bytes, with lengths
-// from 0 to 300 in turn. The same on every machine.
+// from 0 to 300 in turn. The texts are the same on every machine.
 inline constexpr std::size_t kHashedStrings = 10'000;
 
 inline std::string hashedString(std::size_t index) {

@@ -141,7 +141,7 @@ void LoadClient::pipeline(std::int64_t count, std::int64_t window, const Message
   std::int64_t sent = 0;
   while (answered_ < count) {
     while (sent < count && sent - answered_ < window) {
-      // The number is a field of the message: equal numbers make equal messages.
+      // The number is a field of the message, and equal numbers make equal messages.
       sendOne(shape.content == Content::kDistinct ? sent : 0, shape);
       ++sent;
     }

@@ -95,8 +95,8 @@ void measureThroughput(const LoadOptions& options, std::vector<Measurement>& res
   std::vector<Cost> stored;
   std::vector<Cost> unwanted;
   for (int round = 0; round < options.rounds; ++round) {
-    // Each round has one run of each kind: other work on the machine then affects all kinds alike,
-    // and their ratios little.
+    // Each round has one run of each kind. Other work on the machine then affects all kinds alike,
+    // and hardly changes their ratios.
     echo.push_back(oneRun(options, ServerKind::kEcho));
     linked.push_back(oneRun(options, ServerKind::kStored, kLocalLink));
     stored.push_back(oneRun(options, ServerKind::kStored));

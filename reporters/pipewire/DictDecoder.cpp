@@ -11,7 +11,7 @@ Properties makeProperties(const spa_dict* dict) {
   }
   const spa_dict_item* item = nullptr;
   spa_dict_for_each(item, dict) {
-    // The dictionary comes from another process: an entry may lack its key or its value.
+    // The dictionary comes from another process. An entry may lack its key or its value.
     if (item->key != nullptr && item->value != nullptr) {
       properties.insert_or_assign(item->key, item->value);
     }

@@ -20,7 +20,7 @@ class HalvoxReportingClient final : public ReportingClient {
     client_.setConfiguration(id, configuration);
   }
   void start(ReporterID id) override { client_.start(id); }
-  // The result is ignored: the library counts messages that it drops.
+  // The result is ignored, because the library counts the messages that it drops.
   void send(ReporterID id, const platform::Dictionary& message, Category category,
             EventType type) override {
     static_cast<void>(client_.send(id, message, category, type));

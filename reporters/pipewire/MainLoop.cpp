@@ -38,8 +38,8 @@ class MainLoop::Impl {
   void quit() { pw_main_loop_quit(loop_); }
 
   std::function<void()> makeNotifier(std::function<void()> call) {
-    // Each call has its own allocation: the library keeps its address, which must not change when
-    // the vector grows.
+    // Each call has its own allocation, because the library keeps the address of the call, which
+    // must not change when the vector grows.
     calls_.push_back(std::make_unique<std::function<void()>>(std::move(call)));
     spa_source* source = pw_loop_add_event(handle(), &Impl::onEvent, calls_.back().get());
     if (source == nullptr) {

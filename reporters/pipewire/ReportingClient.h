@@ -25,7 +25,7 @@ class ReportingClient {
   virtual void setServiceType(ReporterID id, ServiceType type) = 0;
   // Adds the entries to the session's configuration; entries with the same keys are replaced.
   virtual void setConfiguration(ReporterID id, const platform::Dictionary& configuration) = 0;
-  // A start has no reply here: the service answers it at the stop.
+  // A start has no reply here, because the service answers it only at the stop.
   virtual void start(ReporterID id) = 0;
   virtual void send(ReporterID id, const platform::Dictionary& message, Category category,
                     EventType type) = 0;

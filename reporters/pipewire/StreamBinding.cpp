@@ -17,8 +17,8 @@ StreamBinding::StreamBinding(pw_registry* registry, std::uint32_t id, StreamList
     return;
   }
   binding_.listen(&kEvents, this);
-  // The server sends the current values at once, and new ones when they change: nothing has to be
-  // polled.
+  // The server sends the current values at once, and new ones when they change. Therefore nothing
+  // has to be polled.
   std::array<std::uint32_t, 2> params{SPA_PARAM_Format, SPA_PARAM_Props};
   auto* node = reinterpret_cast<pw_node*>(binding_.proxy());
   pw_node_subscribe_params(node, params.data(), params.size());

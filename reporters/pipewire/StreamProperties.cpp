@@ -64,8 +64,8 @@ bool equalIgnoringCase(std::string_view left, std::string_view right) {
 // Returns the text of the first of these properties that is not empty.
 std::string firstText(const Properties& properties, std::initializer_list<const char*> keys) {
   for (const char* key : keys) {
-    // An empty text counts as missing: a stream may name itself with one although its client has a
-    // name.
+    // An empty text counts as missing, because a stream may have an empty name although its client
+    // has a name.
     if (const auto text = property(properties, key); !text.empty()) {
       return cleanText(text);
     }

@@ -41,7 +41,7 @@ class StreamSession {
   void setRunning(bool running);
   // The stream has this format now; a format without any known value is ignored.
   void setFormat(const StreamFormat& format);
-  // Ignores an empty route: a stream that is being moved has no device for a moment.
+  // Ignores an empty route, because a stream that is being moved has no device for a moment.
   void setRoute(const Route& route);
   // Volume controls of the stream have changed. Sends the volume if it or the playing
   // state differs from the last message.

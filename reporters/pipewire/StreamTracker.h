@@ -57,8 +57,8 @@ class StreamTracker {
   // state again.
   void serviceRestarted();
 
-  // A node exists: a stream gets a session, a device is remembered for routes. Replaces a stream
-  // that has this ID.
+  // A node has appeared. A stream gets a session; a device is remembered for routes. Replaces a
+  // stream that has this ID.
   void nodeAdded(const Node& node);
   // Ends the session of a stream. Any object may be named.
   void nodeRemoved(GlobalID id);
@@ -76,7 +76,8 @@ class StreamTracker {
                   std::span<const GlobalID> lateNodes);
 
   [[nodiscard]] std::size_t streamCount() const { return streams_.size(); }
-  // The number of streams without a session: too many, or another stream has the same identifier.
+  // The number of streams that got no session, because there were too many or another stream has
+  // the same identifier.
   [[nodiscard]] std::uint64_t refusedStreams() const { return refusedStreams_; }
 
  private:

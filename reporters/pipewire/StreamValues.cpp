@@ -24,7 +24,7 @@ bool isVolume(float volume) { return std::isfinite(volume) && volume >= 0; }
 std::string cleanText(std::string_view text) {
   constexpr std::size_t kLongestCharacter = 4;
   std::string result;
-  // Leaves room for the longest character: the text is never cut within one.
+  // Leaves room for the longest character, so that the text is never cut within a character.
   while (!text.empty() && result.size() + kLongestCharacter <= kMaxTextBytes) {
     const platform::linux_::Utf8Step step = platform::linux_::nextUtf8(text);
     const bool isKept = step.valid && !isControl(step.character);

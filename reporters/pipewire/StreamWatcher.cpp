@@ -67,7 +67,7 @@ Properties withClient(const Properties& stream, const Properties& client) {
 }  // namespace
 
 // The timer and all callbacks run on the loop thread. A callback may destroy bindings of other
-// objects, but not the one that called it: the library still uses that one.
+// objects, but not the binding that called it, which the library still uses.
 class StreamWatcher::Impl final : public StreamListener, private pipewire::ServerListener {
  public:
   Impl(pw_loop* loop, StreamTracker& tracker, Options options)
@@ -273,7 +273,7 @@ void StreamWatcher::Impl::onServerReached(const pw_core_info& server) {
 
 void StreamWatcher::Impl::onServerLost() {
   options_.log("PipeWire has disconnected; ending its sessions and trying to reconnect");
-  // Let the timer disconnect: the library does not allow that within this call.
+  // Let the timer disconnect, because the library does not allow a disconnect within this call.
   retryAfter(kReconnectSoon);
 }
 
@@ -292,7 +292,7 @@ void StreamWatcher::Impl::onGlobal(const pipewire::Global& global) {
 }
 
 void StreamWatcher::Impl::onGlobalRemoved(GlobalID id) {
-  // An object that is removed can be of any kind: the event has only its ID.
+  // The removed object can be of any kind, because the event has only its ID.
   streams_.erase(id);
   clients_.erase(id);
   if (profilerID_ == id) {

@@ -59,7 +59,7 @@ def words_and_marks(text):
 def own_names(tokens):
     """The names that a source may keep to itself. In doubt, a name is included."""
     names = set()
-    # For each open brace, whether it is of an anonymous namespace.
+    # For each open brace, whether it opened an anonymous namespace.
     anonymous = []
     parentheses = 0
     static = False
@@ -219,7 +219,8 @@ def plan(sources):
     """The units of these sources, the largest first."""
     units = []
     for source in sorted(sources, key=lambda s: s.path):
-        # Neighbours include the same headers: the last unit that takes the source is the best.
+        # The last unit that takes the source is the best one, because neighbours include the same
+        # headers.
         unit = next((u for u in reversed(units) if u.options == source.options and u.takes(source)), None)
         if unit is None:
             unit = Unit(source.options)

@@ -86,7 +86,7 @@ void check(const TraceParams& params) {
   }
 }
 
-// The services are kept: the parser makes its log category only once.
+// The services are kept, because the parser makes its log category only once.
 void read(std::span<const std::uint8_t> bytes) {
   static platform::FakePlatform& fakes = *new platform::FakePlatform;
   static BytesPropertyListService& lists = *new BytesPropertyListService;

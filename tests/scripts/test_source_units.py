@@ -57,7 +57,7 @@ class Units(unittest.TestCase):
                 user = f'#include "{name}"\nint f() {{ return 1; }}\n'
                 self.assertEqual(len(self.units(own, user)), 2, header)
                 self.assertEqual(len(self.units(user, own)), 2, header)
-                # Such a header is no reason to keep other sources apart.
+                # Such a header must not keep other sources apart.
                 self.assertEqual(len(self.units(user, user.replace("f()", "g()"))), 1, header)
 
     def test_headers_that_define_a_type_twice_stay_apart(self):

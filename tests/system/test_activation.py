@@ -49,9 +49,8 @@ class Activation(unittest.TestCase):
         services.mkdir()
         text = SERVICE_FILE.read_text()
         self.assertIn("Exec=/usr/bin/halvox-reportingd\n", text)
-        # Its parent is a process of the bus that ends after the start: the service cannot be
-        # made to end with its parent. If the test is killed, the service ends by itself all the
-        # same.
+        # The service cannot be made to end with its parent, because its parent is a process of the
+        # bus that ends after the start. If the test is killed, the time-out ends the service.
         command = f"{shutil.which('timeout')} 120 {SERVICE}"
         (services / SERVICE_FILE.name).write_text(text.replace("/usr/bin/halvox-reportingd", command))
         configuration = (f"<servicedir>{services}</servicedir>"

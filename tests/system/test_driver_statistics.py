@@ -168,7 +168,7 @@ class DriverStatisticsTest(unittest.TestCase):
         self.start_session(1)
         self.end_session(1)
 
-        # The state is reported all the same.
+        # The state is reported nevertheless.
         self.assertIn(SINK + "State_state", self.wait_for_statistics("State"))
         self.assertEqual(self.statistics("Simple"), [])
         self.assertEqual(self.statistics("Histogram"), [])
@@ -200,7 +200,7 @@ class DriverStatisticsTest(unittest.TestCase):
         self.end_session(3)
         both = self.wait_for_statistics("Simple", 3)[SINK + "Simple_cycles"]
 
-        # The playbacks may take longer than their sound: only the sum is certain.
+        # The playbacks may take longer than their sound. Therefore only the sum is certain.
         self.assertGreater(min(first, second), 0)
         self.assertEqual(both, first + second)
 

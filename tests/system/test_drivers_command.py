@@ -76,11 +76,12 @@ class DriversCommandTest(unittest.TestCase):
     def test_watching_shows_the_change_per_second_until_the_output_is_closed(self):
         write(self.directory, pulses(1000))
         command = self.watch("0.05")
-        # The first line shows that watching has begun: later changes are shown.
+        # The first line shows that watching has begun. Changes after it are shown.
         self.assertEqual(json.loads(command.stdout.readline())["value"], 0)
         write(self.directory, pulses(1600))
 
-        # The number of lines may vary, but each change is in one of them: their sum is exact.
+        # The number of lines may vary, but each change is in one of them. Therefore their sum is
+        # exact.
         changes = []
         wait_for("600 pulses to be shown", lambda: changes.append(
             (line := json.loads(command.stdout.readline()))["value"] * line["seconds"])

@@ -137,7 +137,7 @@ class Snapshots(unittest.TestCase):
             (line for line in service.log().splitlines() if "Response from ailmentReporter" in line), None))
         self.assertIn(str(archive), line)
         self.assertIn(f"size_bytes = {archive.stat().st_size}", line)
-        # As the service measures it: from the request to the file with its final name.
+        # The service measures the time from the request to the file with its final name.
         self.assertLess(float(re.search(r" seconds = ([0-9.e-]+)", line)[1]), WITHIN)
 
     def test_snapshot_is_recorded_and_followed(self):

@@ -225,7 +225,7 @@ class NamesTest(WithService):
         for option in ("--category", "--type", "--service"):
             offered = self.completed("link", option)
             self.assertGreater(len(offered), 10, option)
-            # All at the same time: any of them may match.
+            # The options are given together: any of their values may match.
             self.ctl("link", *(word for name in offered for word in (option, name)))
         self.assertIn("longformaudio_session", self.completed("link", "--service"))
         self.assertEqual(self.completed("power", "--category"), [])

@@ -199,7 +199,7 @@ class TextfileStatisticsTest(unittest.TestCase):
             self.start_session()
             self.count_witness()
             self.client.stop(1)
-            # Between two sessions: it is in neither of them.
+            # This growth is between two sessions and belongs to neither of them.
             self.witnessed += 100
             self.write("witness", counter("witness", self.witnessed))
 

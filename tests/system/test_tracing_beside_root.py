@@ -1,4 +1,4 @@
-"""The tests of traces pass beside a tracer's daemon of root, whatever it does, and leave it alone."""
+"""The tests of traces pass while root has a tracer's daemon, whatever it does, and leave it alone."""
 
 import json
 import os

@@ -60,7 +60,7 @@ class NoTracerTest(unittest.TestCase):
             self.assertIn("started performance trace.", service.log())
             self.assertNotIn("Performance Trace Started", service.log())
 
-            # This stop waits for a completion that never comes. The service ends all the same.
+            # This stop waits for a completion that never comes. The service ends nevertheless.
             stop = client.call_later("stopReportingSessionForID", "x", REPORTER)
             wait_for("the stop to be carried out",
                      lambda: f"ending session {REPORTER}" in service.log())

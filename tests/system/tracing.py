@@ -38,7 +38,8 @@ POINTS = [
     interval("Shared", 0x21040010, 0x21040014),
     interval("CrossByThread", 0x21040018, 0x2104001C),
     interval("CrossByProcess", 0x21040018, 0x2104001C, "Process"),
-    # The first and the last recorded code, and the codes beside them that are not recorded.
+    # The first and the last recorded code, and the codes just outside this range, which are not
+    # recorded.
     interval("Outside", 0x2103FFFF, 0x2104408B),
     interval("Edges", 0x21040000, 0x2104408A),
 ] + [interval(f"Own{n}", 0x21040020 + 8 * n, 0x21040024 + 8 * n) for n in range(THREADS)]

@@ -81,7 +81,8 @@ class Source:
         before = self.tokens[index - 1]
         if before.text in _BEFORE_BLOCK:
             return True
-        # A block of its own, and one after a label or a constructor's member initialisers.
+        # Also a block that follows another statement or block, a label, or a constructor's member
+        # initialisers.
         nested = any(first < index < last for first, last in blocks)
         return before.text == "}" or (nested and before.text in {";", "{", ":"})
 
