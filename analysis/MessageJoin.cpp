@@ -10,8 +10,8 @@ namespace {
 
 constexpr std::string_view kStampKey = "hvreporting_timestamp";
 
-// The stamp has fractions of a microsecond: two messages of one category and type have the same
-// only if a client sent one message to several sessions.
+// The stamp has fractions of a microsecond. Two messages of one category and type therefore have
+// the same stamp only if a client sent one message to several sessions.
 std::uint64_t keyOf(const Record& record) {
   const auto stamp = record.payload->number(kStampKey);
   if (!stamp || record.category.empty()) return 0;
@@ -42,7 +42,7 @@ void MessageJoin::add(const Record& record) {
 
 void MessageJoin::addEvent(const Record& record) {
   if (record.category.empty()) {
-    // Not a message. It keeps its place among them.
+    // This event is not a message, but keeps its place among the messages.
     Waiting& event = push(record, 0);
     event.message.name = record.name;
     event.isComplete = true;
@@ -54,14 +54,16 @@ void MessageJoin::addEvent(const Record& record) {
   Waiting* message = find(key, record);
   if (message == nullptr) message = &push(record, key);
   message->message.isEvent = true;
-  // The link's payload has another key; the twin is recognised by the event's.
+  // The link's payload has another key. The event's payload replaces it, because the second event
+  // of a message is recognised by its equal payload.
   if (message->message.isLinkMessage) message->message.payload = record.payload->json();
   message->message.application = record.application;
   message->hasCommon = isCommon;
   if (!isCommon) message->message.service = record.service;
 }
 
-// The second event of a message follows the first without another event between them.
+// True if the record is the second event of a message. It follows the first one without another
+// event between them.
 bool MessageJoin::completesTwin(const Record& record) {
   if (record.service == kCommonService || !lastEvent_) return false;
   Waiting* const last = waiting(*std::exchange(lastEvent_, std::nullopt));
@@ -80,7 +82,7 @@ void MessageJoin::addLinkMessage(const Record& record) {
   Waiting* message = find(key, record);
   if (message == nullptr) {
     message = &push(record, key);
-    // Without a stamp nothing finds it.
+    // Without a stamp no later record can find this message.
     message->isComplete = key == 0;
   } else {
     message->isComplete = !message->message.service.empty();
@@ -105,7 +107,8 @@ MessageJoin::Waiting* MessageJoin::find(std::uint64_t key, const Record& record)
     const std::string_view service =
         record.service == kCommonService ? std::string_view() : record.service;
     if (!isSame(message.service, service)) continue;
-    // The oldest: a message to several sessions reaches them in one order.
+    // Takes the oldest one, because a message to several sessions reaches them in the same order
+    // each time.
     if (found != nullptr && place->second > foundNumber) continue;
     found = candidate;
     foundNumber = place->second;
@@ -143,7 +146,7 @@ void MessageJoin::deliverReady(double now) {
 }
 
 void MessageJoin::deliverFirst() {
-  // Taken out first: the callback may take long, but it must not see a half-delivered queue.
+  // Taken out of the queue before the callback, which must not see a half-delivered queue.
   Waiting first = std::move(waiting_.front());
   waiting_.pop_front();
   const std::uint64_t number = firstNumber_++;

@@ -32,10 +32,11 @@ struct Message {
 // equal, and one link message for each session, which has another key in its payload. The stamp
 // that the service puts into each message brings event and link message together.
 //
-// The link records later than the events, and some messages never: those that repeat the one
-// before, and those of a service without a link in the store. A message therefore waits for its
-// other record until kLongestWait seconds of records, or kMostWaiting messages, have passed.
-// Messages come out in the order of their first records. Memory is bounded. Belongs to one thread.
+// The link records a message later than the events do. It never records a message that repeats the
+// one before, or any message of a service without a link in the store. A message therefore waits
+// for its other record until kLongestWait seconds of records, or kMostWaiting messages, have
+// passed. Messages come out in the order of their first records. Memory is bounded. Belongs to one
+// thread.
 class MessageJoin {
  public:
   static constexpr double kLongestWait = 10;

@@ -45,7 +45,7 @@ LinkMessageNames linkMessageNames(std::int64_t category, std::int64_t type,
       client::categoryName(static_cast<client::Category>(category) & kCategoryProper);
   const std::string_view typeName = client::eventTypeName(static_cast<client::EventType>(type));
   LinkMessageNames names{.category = proper, .type = typeName};
-  // The payload has what its client wrote; the tag counts only if it fits the numbers.
+  // Clients write payloads. The tag counts only if it fits the numbers.
   std::string_view tag = payload.text(kTag).value_or(std::string_view());
   if (!tag.ends_with(typeName)) return names;
   tag.remove_suffix(typeName.size());

@@ -34,7 +34,8 @@ std::string storyText(std::string_view text) {
 
 bool isStampLike(double time) { return std::isfinite(time) && time > 0; }
 
-// Whether a category is about running: its name, with or without a domain, ends so.
+// The direction in which a stream of this category runs; none if the category, whatever its domain,
+// is not about running.
 std::optional<StreamDirection> directionOf(std::string_view category) {
   const std::size_t domain = category.rfind('_');
   if (domain != std::string_view::npos) category.remove_prefix(domain + 1);
@@ -44,7 +45,8 @@ std::optional<StreamDirection> directionOf(std::string_view category) {
   return std::nullopt;
 }
 
-// Adds a change if it is one. Returns whether it is.
+// Records a change unless the value is the same as before. Beyond the bound, changes are only
+// counted. Returns true if the value has changed.
 bool addChange(std::vector<StreamChange>& changes, std::uint64_t& notKept, StreamChange change) {
   if (!changes.empty() && changes.back().text == change.text &&
       changes.back().names == change.names) {
@@ -62,7 +64,7 @@ double positive(const Payload& payload, std::string_view key) {
   return std::max(0.0, payload.number(key).value_or(0));
 }
 
-// A count of what was missed, or of samples. What does not fit is a client's mistake.
+// A count of missed cycles or of samples. A number that is out of range is a client's mistake.
 std::int64_t count(const Payload& payload, std::string_view key) {
   constexpr std::int64_t kMost = std::int64_t{1} << 40U;
   return std::clamp<std::int64_t>(payload.integer(key).value_or(0), 0, kMost);
@@ -108,7 +110,7 @@ void OpenStream::add(const Message& message, const Payload& payload) {
     }
   }
   if (payload.text(kIssueTypeKey) == "xrun") return onXrun(message, payload);
-  // One message may have several of these.
+  // One message may have several of these keys.
   const bool hasState =
       payload.text(kFormatKey) || payload.text(kDevicesKey) || payload.has(kVolumeKey);
   if (hasState && message.type != "Summary") {
@@ -167,7 +169,7 @@ void OpenStream::addVolumeTime(double seconds) {
 void OpenStream::onRun(const Message& message, bool starts) {
   isInRun_ = starts;
   hasStarted_ = hasStarted_ || starts;
-  // A client that stops plays no longer, whether it says so or not.
+  // A client that stops plays no longer, whether or not it reports that.
   if (!starts) isPlaying_ = false;
   report(starts ? StreamMoment::Kind::kStart : StreamMoment::Kind::kStop, message);
 }
@@ -258,7 +260,7 @@ void OpenStream::onRoute(const Message& message, const Payload& payload) {
 }
 
 void OpenStream::end(StreamEnd end, double time) {
-  // Never before its last message: the clock may have been set back since.
+  // A story never ends before its last message, although the clock may have been set back since.
   if (time > last_.stamp) {
     const std::optional<double> uptime =
         last_.uptime ? std::optional(*last_.uptime + time - last_.stamp) : std::nullopt;

@@ -32,8 +32,9 @@ class OpenStream {
   void setSessionID(std::int64_t sessionID) { story_.sessionID = sessionID; }
   void setSerial(std::int64_t serial) { story_.objectSerial = serial; }
 
-  // The builder's notes: where this is in its list, its key in the index by program, and when its
-  // session ended, if that was while it ran and it is not known why.
+  // The builder's notes: the place of this stream in the builder's list, its key in the index by
+  // program, and the time at which its session ended. The time is set only if the session ended
+  // while the stream ran and the reason is not known yet.
   std::list<std::unique_ptr<OpenStream>>::iterator place{};
   std::uint64_t program = 0;
   std::optional<double> undecidedSince{};

@@ -13,9 +13,10 @@ namespace {
 using Allocator = rapidjson::MemoryPoolAllocator<>;
 using Document = rapidjson::GenericDocument<rapidjson::UTF8<>, Allocator>;
 
-// Most payloads fit: parsing them allocates nothing but the parser's stack.
+// Most payloads fit. Parsing them allocates nothing but the parser's stack.
 constexpr std::size_t kPoolBytes = 32 * 1024;
-// Iterative: a payload may be nested deeply, and the recursive parser would overflow the stack.
+// The parser is the iterative one, because a payload may be nested deeply and the recursive parser
+// would overflow the stack.
 constexpr unsigned kParseFlags =
     rapidjson::kParseIterativeFlag | rapidjson::kParseFullPrecisionFlag;
 

@@ -42,7 +42,7 @@ class RecordMaker {
     record_.category = parts.category;
     record_.type = parts.type;
     record_.application = item.application;
-    // A service of an earlier version did not store it beside the payload.
+    // A service of an earlier version stored the application only in the payload.
     if (record_.application.empty()) {
       record_.application = payload_.text(kApplicationKey).value_or(std::string_view());
     }

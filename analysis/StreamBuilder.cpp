@@ -26,7 +26,8 @@ bool isSummary(const Message& message, const Payload& payload) {
          payload.text(kSummaryKey).has_value();
 }
 
-// What the service itself sends at the end of a session. It does not begin a story.
+// True for what the service itself sends at the end of a session. Such a message does not begin a
+// story.
 bool isEndReport(const Message& message) {
   return message.category == "IOReporting" || message.type == "Summary" ||
          message.type == "Unknown";
@@ -70,8 +71,8 @@ void StreamBuilder::onMessage(const Message& message) {
   noteProgram(*stream, message);
 }
 
-// The two uptimes of a message are of one clock: their difference is the same for all messages of
-// one process, but for rounding to a second.
+// The two uptimes of a message come from one clock. Apart from rounding to a second, their
+// difference is the same for all messages of one process.
 void StreamBuilder::noticeRestart(const Message& message, double before) {
   constexpr double kRounding = 2;
   constexpr double kDisorder = 0.1;
@@ -124,8 +125,8 @@ OpenStream* StreamBuilder::findBySerial(std::int64_t serial, const Message& mess
         !std::string_view(message.application).starts_with(story.application)) {
       continue;
     }
-    // A session that has ended takes nothing more. A first run after another one is of a stream
-    // that got the serial after a restart of PipeWire.
+    // A session that has ended takes no more messages. A first run after another run belongs to
+    // another stream, which got the same serial after a restart of PipeWire.
     const bool isFirstRun = message.type == "Start" && payload_.integer("run") == 1;
     if (stream.undecidedSince || (isFirstRun && stream.hasStarted())) {
       close(stream, StreamEnd::kStopped, 0);
@@ -166,7 +167,8 @@ void StreamBuilder::onClientGone(const Message& message) {
       payload_.text("processName").value_or(std::string_view()).starts_with(kReporterProcess);
   std::vector<OpenStream*> gone;
   for (const auto& stream : streams_) {
-    // Without a link nothing else marks the end of the reporter's sessions.
+    // Without a link, nothing but the end of the reporter's connection marks the end of its
+    // sessions.
     const bool isReporters =
         isReporter && stream->story().objectSerial && !stream->story().sessionID;
     if (stream->undecidedSince || isReporters) gone.push_back(stream.get());
@@ -180,7 +182,7 @@ void StreamBuilder::onClientGone(const Message& message) {
 void StreamBuilder::settleUndecided(double now) {
   const std::vector<OpenStream*> undecided = undecided_;
   for (OpenStream* const stream : undecided) {
-    // Also if the clock was set back.
+    // The absolute difference also settles streams after the clock was set back.
     if (std::abs(now - *stream->undecidedSince) <= kSameMoment) continue;
     close(*stream, StreamEnd::kStopped, *stream->undecidedSince);
   }
@@ -208,7 +210,7 @@ void StreamBuilder::close(OpenStream& stream, StreamEnd end, double time) {
 }
 
 void StreamBuilder::noteProgram(OpenStream& stream, const Message& message) {
-  // A message of the link alone does not name its application.
+  // A message that only the link recorded does not name its application.
   if (!message.isEvent) return;
   const std::uint64_t program = programOf(message.application, message.service);
   if (program != stream.program) forgetProgram(stream);
@@ -224,7 +226,7 @@ void StreamBuilder::forgetProgram(const OpenStream& stream) {
 void StreamBuilder::closeAll(StreamEnd end, double time) {
   while (!streams_.empty()) {
     OpenStream& stream = *streams_.front();
-    // A session that had ended did not lose its service.
+    // A session that had ended before did not lose its service.
     if (stream.undecidedSince) {
       close(stream, StreamEnd::kStopped, *stream.undecidedSince);
     } else {

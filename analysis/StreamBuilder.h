@@ -26,8 +26,9 @@ class OpenStream;
 // Whose message it is:
 // - A message with `object_serial` belongs to the PipeWire stream with that serial and application.
 // - Any other message belongs to the session of its link message.
-// - A message without either (the link was disabled, or it repeats the one before) belongs to the
-//   newest open story of the same application and service type, else it begins a story.
+// - A message with neither (because the link was disabled, or because the message repeats the one
+//   before) belongs to the newest open story of the same application and service type. If there is
+//   none, it begins a story.
 // - Messages outside sessions belong to no story.
 //
 // What ends a story: the summary that a session leaves on the link; the first run of another stream
@@ -55,7 +56,7 @@ class StreamBuilder {
   struct Finish {
     // Streams that run, run until then; empty: until the last record.
     std::optional<double> now{};
-    // No service runs that could still write: whatever is open has lost its service.
+    // True if no service runs that could still write. Whatever is open has then lost its service.
     bool serviceIsGone = false;
   };
 
@@ -70,7 +71,7 @@ class StreamBuilder {
   void finish(const Finish& finish);
 
  private:
-  // Front: the one whose last message is the oldest.
+  // In front is the stream whose last message is the oldest.
   using Streams = std::list<std::unique_ptr<OpenStream>>;
   void onMessage(const Message& message);
   void onClientGone(const Message& message);

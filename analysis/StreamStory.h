@@ -11,7 +11,8 @@
 namespace halvox::analysis {
 
 constexpr std::size_t kLongestStoryText = 1024;
-// Changes and volumes beyond these bounds are counted and not kept: a client may send millions.
+// Changes and volumes beyond these bounds are counted and not kept, because a client may send
+// millions.
 constexpr std::size_t kMostStoryChanges = 256;
 constexpr std::size_t kMostStoryVolumes = 256;
 
@@ -68,7 +69,7 @@ struct StreamStory {
   std::vector<VolumeTime> volumes;
   double otherVolumeSeconds = 0;  // at volumes beyond kMostStoryVolumes
 
-  // Each begins with the first one that the client reported.
+  // Each list begins with the first value that the client reported.
   std::vector<StreamChange> formats;
   std::vector<StreamChange> routes;
   std::uint64_t formatsNotKept = 0;

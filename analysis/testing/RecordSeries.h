@@ -61,7 +61,7 @@ class RecordSeries final : public RecordSource {
     stored.type = type;
     stored.sessionID = sender.sessionID.value_or(-1);
   }
-  // What a stop leaves on the link.
+  // Adds the summary that a stop sends through the link.
   void summary(const Sender& sender) {
     Stored& stored = add(RecordKind::kLinkMessage, R"({"HV_Session_Summary_Event":"7"})");
     stored.service = sender.service;
