@@ -28,7 +28,7 @@ class RootedFileHarness {
   std::vector<std::string> keys(const std::string& directory, const std::string& name) const {
     std::ifstream file(pathOf(directory) / name);
     const std::string text((std::istreambuf_iterator<char>(file)), {});
-    // The test's objects have one entry each, a dictionary of numbers.
+    // Each object of the test has one entry, which is a dictionary of numbers.
     static const std::regex kKey("\"([a-z]+)\": *\\{");
     std::vector<std::string> keys;
     for (std::sregex_iterator match(text.begin(), text.end(), kKey), end; match != end; ++match) {

@@ -14,10 +14,11 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-constexpr mode_t kPermissions = 0600;  // what clients reported
+constexpr mode_t kPermissions = 0600;  // private, because the file has what clients reported
 constexpr std::uint64_t kMegabyte = 1024 * 1024;
 constexpr std::uint64_t kSharesOfMemory = 4;
-// Only whole blocks can be punched out of a file. Each piece begins at a block: no two share one.
+// Only whole blocks can be punched out of a file. Each piece therefore begins at a multiple of this
+// size, and no two pieces share a block.
 constexpr std::uint64_t kBlock = 4096;
 
 std::uint64_t blocksOf(std::size_t length) { return (length + kBlock - 1) / kBlock * kBlock; }
@@ -45,7 +46,7 @@ int readAll(int file, std::span<std::byte> bytes, std::uint64_t offset) {
   return 0;
 }
 
-// For file systems without O_TMPFILE: creates a file with a name and removes the name.
+// Creates a file with a name and removes the name. For file systems without O_TMPFILE.
 int createUnnamed(const std::filesystem::path& directory, UniqueFd& file) {
   std::string name = (directory / ".halvox-overflow-XXXXXX").string();
   file.reset(::mkostemp(name.data(), O_CLOEXEC));
@@ -115,15 +116,17 @@ void FileOverflowService::release(OverflowPlace place) {
   counters_.released.add(place.length);
 }
 
-// A file system that cannot punch holes keeps the room until the last piece is released.
+// Frees the disk space of a piece. If the file system cannot punch holes, the space stays in use
+// until the last piece is released.
 void FileOverflowService::giveBack(OverflowPlace place) {
   used_ -= place.length;
   if (used_ == 0) {
-    // No thread is writing: a writer adds its bytes to used_ before it begins.
+    // No thread is writing now, because a writer adds its bytes to used_ before it begins.
     end_ = ::ftruncate(file_.get(), 0) == 0 ? 0 : end_;
     return;
   }
-  // While the disk is full each message tries to write. The file's end must not move on each time.
+  // If this was the last piece, move the end of the file back. While the disk is full, each message
+  // tries to write, and the end must not advance with each attempt.
   if (end_ == place.offset + blocksOf(place.length)) end_ = place.offset;
   ::fallocate(file_.get(), FALLOC_FL_PUNCH_HOLE | FALLOC_FL_KEEP_SIZE,
               static_cast<off_t>(place.offset), static_cast<off_t>(blocksOf(place.length)));

@@ -15,19 +15,20 @@
 namespace halvox::platform::linux_ {
 
 struct OverflowOptions {
-  // Where the file is. The directory is made when the file is needed.
+  // The directory of the file. It is made when the file is first needed.
   std::filesystem::path directory;
-  // MiB of memory that the service keeps for one client. Histories begin to overflow at a quarter
-  // of it. The rest is for what cannot leave memory.
+  // The memory, in MiB, that the service holds for one client at most. Histories begin to overflow
+  // into the file at a quarter of this memory. The rest is for data that cannot leave memory.
   std::uint64_t clientMegabytes = defaults::kClientHistoryMegabytes;
 };
 
-// Keeps bytes in one file without a name, which the kernel removes with the process. The file is
-// made when it is first needed. Room that is given back is punched out of the file, and the file is
-// cut to nothing when all of it has been given back.
+// Stores bytes in one file without a name, which the kernel removes when the process ends. The file
+// is made when it is first needed. release() punches the released bytes out of the file. When all
+// bytes have been released, the file is truncated.
 //
-// Any thread may call; writes and reads of different threads run side by side. An error has the
-// directory and the system's text; a later write tries again. Counts what it writes and what fails.
+// Any thread may call. Different threads may write and read at the same time. An error names the
+// directory and has the system's text. A later write tries again. Counts the written and released
+// bytes, and the failures.
 class FileOverflowService final : public OverflowService {
  public:
   // Does not own `statistics`, which must outlive this.

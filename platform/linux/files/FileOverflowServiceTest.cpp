@@ -28,7 +28,7 @@ class FileOverflowServiceTest : public ::testing::Test {
     const std::vector<std::byte> bytes(length, std::byte{'a'});
     return service_.write(bytes, place);
   }
-  // The unnamed file, as the process has it open.
+  // Finds the unnamed file among the open descriptors of the process.
   [[nodiscard]] std::optional<struct stat> file() const {
     for (const auto& entry : std::filesystem::directory_iterator("/proc/self/fd")) {
       std::error_code none;  // the iterator's own descriptor is gone
@@ -105,7 +105,8 @@ TEST_F(FileOverflowServiceTest, SaysWhereItCannotCreateTheFileAndTriesAgain) {
   EXPECT_EQ(write(kPiece, place), std::nullopt);
 }
 
-// A limit of the size of files fails as a full disk does: in the middle of a piece.
+// A write that reaches the limit on the size of files fails in the middle of a piece, as on a full
+// disk.
 TEST_F(FileOverflowServiceTest, KeepsNothingOfAPieceThatDoesNotFit) {
   OverflowPlace first;
   ASSERT_EQ(write(kPiece, first), std::nullopt);

@@ -1,4 +1,4 @@
-// The contract of overflow, kept by the adapter.
+// Runs the contract suite of overflow on the adapter.
 
 #include "platform/fake/contracts/OverflowContract.h"
 

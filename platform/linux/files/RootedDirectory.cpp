@@ -30,8 +30,8 @@ std::optional<std::vector<std::string>> namesOf(std::string_view path) {
   return names;
 }
 
-// Replaces the system's error for a symbolic link in the path. With O_NOFOLLOW and O_DIRECTORY it
-// is "not a directory", which does not help to find the cause.
+// Returns ELOOP if `name` is a symbolic link. With O_NOFOLLOW and O_DIRECTORY the system's error
+// for a link is "not a directory", which does not help to find the cause.
 int reasonAt(const UniqueFd& parent, const std::string& name, int systemError) {
   struct stat status {};
   const bool isLink = ::fstatat(parent.get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 &&
@@ -49,7 +49,7 @@ RootedDirectory step(const UniqueFd& parent, const std::string& name, const std:
     made = ::mkdirat(parent.get(), name.c_str(), kParentPermissions) == 0;
     if (!made && errno != EEXIST) return failed("create directory", path, errno);
   }
-  // One name at a time: O_NOFOLLOW looks at the last name of a path only.
+  // Open one name at a time, because O_NOFOLLOW checks only the last name of a path.
   UniqueFd directory(::openat(parent.get(), name.c_str(), kOpenFlags | O_NOFOLLOW));
   if (!directory) return failed("open directory", path, reasonAt(parent, name, errno));
   return {std::move(directory), std::nullopt};
@@ -68,7 +68,7 @@ RootedDirectory walk(const RootedDirectory::Place& place, Missing missing,
     at = step(at.descriptor, name, path, missing, made);
     if (at.error.has_value()) return at;
   }
-  // mkdirat() applies the umask; fchmod() does not.
+  // Set the permissions with fchmod(), because mkdirat() applies the umask.
   if (made && permissions.has_value() && ::fchmod(at.descriptor.get(), *permissions) != 0) {
     return failed("set the permissions of directory", path, errno);
   }

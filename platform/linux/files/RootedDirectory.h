@@ -11,13 +11,14 @@
 
 namespace halvox::platform::linux_ {
 
-// An open directory below a root. The path is opened one name at a time, without following a
-// symbolic link below the root, and ".." is refused. A program that may write below the root
-// therefore cannot redirect the service to a place outside it. The root itself may be a link.
+// An open directory below a root, or the error of opening it. The path is opened one name at a
+// time. Symbolic links below the root are not followed, and ".." is refused. A program that may
+// write below the root therefore cannot redirect the service to a place outside the root. The root
+// itself may be a link.
 //
 // Any thread may use it. Blocks on the disk.
 struct RootedDirectory {
-  // A path that callers see as absolute, and that lies below `root` in the file system.
+  // A path that is absolute for callers. In the file system it is below `root`.
   struct Place {
     const std::filesystem::path& root;
     std::string_view path;
@@ -29,8 +30,8 @@ struct RootedDirectory {
   std::optional<Error> error;  // set when there is no descriptor
 
   [[nodiscard]] static RootedDirectory open(const Place& place);
-  // Creates the directories that are missing. The last one gets exactly `permissions`, regardless
-  // of the umask. Directories that exist are not changed.
+  // Creates the missing directories. If the last one is created, it gets exactly `permissions`,
+  // regardless of the umask. Directories that exist are not changed.
   [[nodiscard]] static RootedDirectory make(const Place& place, std::uint32_t permissions);
 };
 

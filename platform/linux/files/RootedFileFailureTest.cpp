@@ -1,4 +1,5 @@
-// Tests what happens if the system refuses a file or a directory, and what a killed service leaves.
+// Tests what happens if the system refuses a file or a directory, and which files a killed service
+// leaves.
 
 #include <cerrno>
 #include <filesystem>
@@ -107,7 +108,7 @@ TEST_F(RootedFileFailureTest, DirectoryThatMayNotBeWrittenIsAnError) {
   fs::permissions(scratch_, fs::perms(0755));
   const pid_t child = ::fork();
   if (child == 0) {
-    // Become another user: root may write everywhere.
+    // Become another user, because root may write everywhere.
     if (::geteuid() == 0 && ::setresuid(kNobody, kNobody, kNobody) != 0) ::_exit(99);
     ::_exit(codeOf(*service_.createJsonArrayFile("/a", "f.json")) == EACCES &&
                     service_.createDirectory("/a/b", 0777)->code == EACCES

@@ -14,7 +14,7 @@ namespace {
 
 constexpr std::size_t kBufferBytes = 64 * 1024;
 
-// Returns an errno for a name that a file cannot have, else 0.
+// Returns an errno if a file cannot have this name, and 0 otherwise.
 int checkName(std::string_view name) {
   constexpr std::string_view kNotInNames("/\0", 2);
   if (name.empty() || name == "." || name == "..") return EINVAL;
@@ -46,7 +46,7 @@ class RootedJsonArrayFile final : public JsonArrayFile {
 
   std::optional<Error> commit(std::string& path) override {
     if (!isCommitted_ && !error_.has_value()) finish();
-    // Count it only once, even if the caller tries again.
+    // Count the file only once, even if the caller calls commit() again.
     if (!isCommitted_) (error_.has_value() ? counters_.failed : counters_.written).add();
     isCommitted_ = true;
     if (!error_.has_value()) path = path_;
@@ -64,7 +64,8 @@ class RootedJsonArrayFile final : public JsonArrayFile {
     }
   }
 
-  // Collect text until a write has at least kBufferBytes: a single object is much shorter.
+  // Collects text and writes it when there are at least kBufferBytes. Writing each object alone
+  // would be slow, because an object is much shorter.
   void takeText() {
     buffer_ += json_.takeText();
     if (buffer_.size() >= kBufferBytes) flush();
@@ -83,8 +84,8 @@ class RootedJsonArrayFile final : public JsonArrayFile {
     if (const int error = file_.finish(name_)) fail("finish", error);
   }
 
-  // Frees the disk space of the file at once: the disk may be full, and the caller may keep this
-  // object for long.
+  // Frees the disk space of the file at once, because the disk may be full and the caller may keep
+  // this object for long.
   void fail(std::string_view what, int systemError) {
     error_ = fileError(what, path_, systemError);
     file_.discard();

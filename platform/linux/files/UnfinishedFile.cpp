@@ -19,7 +19,8 @@ using DirectoryStream = UniqueHandle<DIR*, ::closedir>;
 constexpr mode_t kPermissions = 0644;
 constexpr std::string_view kOwnNameStart = ".halvox-";
 constexpr std::string_view kOwnNameEnd = ".tmp";
-// A younger file may be one that another process has created but not locked yet.
+// Left-over files must be at least this old. Another process may have created a younger file and
+// not locked it yet.
 constexpr std::chrono::seconds kLeftOverAge{60};
 
 std::string makeOwnName() {
@@ -36,8 +37,8 @@ bool isLeftOver(int directory, const char* name) {
   struct stat status {};
   if (!file || ::fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) return false;
   const auto age = ::time(nullptr) - status.st_mtime;
-  // A file that is still being written is locked by its writer. The kernel releases the lock of one
-  // that was killed.
+  // The writer holds a lock on a file that it still writes. If the writer was killed, the kernel
+  // has released the lock.
   return age > kLeftOverAge.count() && ::flock(file.get(), LOCK_EX | LOCK_NB) == 0;
 }
 
@@ -46,8 +47,8 @@ bool isLeftOver(int directory, const char* name) {
 int UnfinishedFile::begin(UniqueFd directory, Naming naming) {
   directory_ = std::move(directory);
   if (naming == Naming::kOwnName) return beginNamed();
-  // A file without a name: the kernel removes it with its last descriptor, however the process
-  // ends.
+  // Try to create a file without a name. The kernel removes such a file with its last descriptor,
+  // even if the process is killed.
   file_.reset(::openat(directory_.get(), ".", O_TMPFILE | O_WRONLY | O_CLOEXEC, kPermissions));
   if (file_) return 0;
   const bool isUnknown = errno == EOPNOTSUPP || errno == EISDIR || errno == EINVAL;
@@ -64,7 +65,7 @@ int UnfinishedFile::beginNamed() {
     ownName_.clear();
     return errno;
   }
-  // Until the file is locked, its age protects it: other processes remove only older files.
+  // Until the file is locked, its age protects it, because other processes remove only older files.
   return ::flock(file_.get(), LOCK_EX | LOCK_NB) == 0 ? 0 : errno;
 }
 
@@ -79,15 +80,15 @@ int UnfinishedFile::write(std::string_view bytes) {
 }
 
 int UnfinishedFile::finish(const std::string& name) {
-  // Sync before the file gets its name: after a power cut, a file with a name must have its
+  // Sync the file before giving it its name. After a power cut, a file with this name must have its
   // content.
   if (::fsync(file_.get()) != 0) return errno;
   if (const int error = giveName(name)) return error;
   ownName_.clear();
-  // The name is not on the disk before the directory is. A file system that cannot sync a directory
+  // Sync the directory, too, because it holds the name. A file system that cannot sync a directory
   // returns EINVAL; the file is finished nevertheless.
   if (::fsync(directory_.get()) != 0 && errno != EINVAL) return errno;
-  // Do this here, because the directory is being written anyway.
+  // Remove left-over files now, because this changes the directory in any case.
   removeLeftOvers();
   discard();
   return 0;

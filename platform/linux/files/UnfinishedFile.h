@@ -7,14 +7,15 @@
 
 namespace halvox::platform::linux_ {
 
-// A file that gets its name only when it is complete, so that readers never see a part of it.
+// A file that gets its name only when it is complete. Readers therefore never see a part of it.
 //
-// Until then it has no name at all (O_TMPFILE), and the kernel removes it when the process dies.
-// On a file system without that feature it has a temporary name, ".halvox-<pid>-<number>.tmp", and
-// a lock. The lock distinguishes it from the files of a killed service, which finish() deletes.
+// Until it is complete, the file has no name at all (O_TMPFILE), and the kernel removes it when the
+// process ends. On a file system without O_TMPFILE, the file has a temporary name,
+// ".halvox-<pid>-<number>.tmp", and a lock. The lock distinguishes it from the files that a killed
+// service has left, which finish() deletes.
 //
-// Belongs to one thread and one owner. Blocks on the disk. Results are 0 or an errno; after an
-// error only discard() or destruction makes sense.
+// Belongs to one thread and one owner. Blocks on the disk. Functions return 0 or an errno. After an
+// error, only discard() or destruction makes sense.
 class UnfinishedFile {
  public:
   enum class Naming : unsigned char { kNoName, kOwnName };
