@@ -19,7 +19,8 @@ AsioDispatchService::AsioDispatchService(LogService& log, StatisticsService& sta
       runner_(std::make_shared<JobRunner>(log, statistics)),
       pool_(std::make_shared<DispatchPool>(runner_, statistics)) {}
 
-// A year stands for no limit: unlike the largest duration, it can be added to the current time.
+// A year stands for "no limit". The largest duration cannot be used, because adding it to the
+// current time would overflow.
 AsioDispatchService::~AsioDispatchService() { stop(std::chrono::hours(24 * 365)); }
 
 std::shared_ptr<DispatchQueue> AsioDispatchService::createSerialQueue(std::string_view label,
@@ -58,8 +59,8 @@ bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
   {
     const MutexLock lock(mutex_);
     isStopped_ = true;
-    // Copy the list: waiting for the queues under the lock would block a job that makes a queue
-    // forever.
+    // Copy the list, to wait for the queues without the lock. A running job that makes a queue
+    // needs the lock, and would otherwise never end.
     queues = ownThreadQueues_;
   }
   for (const auto& queue : queues) queue->stop();
@@ -74,7 +75,8 @@ bool AsioDispatchService::stop(std::chrono::milliseconds limit) {
     logStuck(stuck);
     return false;
   }
-  // Do not destroy the jobs while another one still runs: it may use what they hold.
+  // Destroy the discarded jobs only now that no job runs any more. A running job may use objects
+  // that they hold.
   pool_->discardJobs();
   const MutexLock lock(mutex_);
   ownThreadQueues_.clear();
@@ -89,8 +91,8 @@ void AsioDispatchService::logStuck(const std::vector<std::string>& labels) {
   log_.write(LogLevel::kError, detail::logPrefix("AsioDispatchService", __LINE__) + text);
 }
 
-// Null if the system cannot start a thread or the service has stopped. The caller then uses the
-// pool, which discards the jobs if the service has stopped.
+// Returns null if the system cannot start a thread or the service has stopped. The caller then
+// makes a shared queue, whose pool discards the jobs if the service has stopped.
 std::shared_ptr<DispatchQueue> AsioDispatchService::createOwnThreadQueue(std::string_view label,
                                                                          QualityOfService quality) {
   const MutexLock lock(mutex_);
@@ -99,9 +101,9 @@ std::shared_ptr<DispatchQueue> AsioDispatchService::createOwnThreadQueue(std::st
   try {
     auto queue = OwnThreadQueue::start(std::string(label), quality, runner_);
     ownThreadQueues_.push_back(queue);
-    // The pointer that is handed out closes the queue when its last holder releases it. The queue
-    // itself stays here until its thread has ended: a job may be the last holder, and its thread
-    // cannot join itself.
+    // When the last holder releases the returned pointer, the queue is closed but not destroyed. It
+    // stays in the list until its thread has ended: the last holder may be a job of the queue, and
+    // the thread that runs this job cannot join itself.
     DispatchQueue* const face = queue.get();
     return {face, [queue = std::move(queue)](DispatchQueue*) { queue->close(); }};
   } catch (const std::system_error& error) {

@@ -29,26 +29,26 @@ class OwnThreadQueue;
 //
 // Quality of service: utility and background work runs at a lower scheduling priority. A thread
 // cannot raise its priority again without a privilege. The pool therefore has threads for each
-// quality, which it makes when they are first needed. What requests wait for must not have a lower
-// quality than the requests. The label of a queue names its own thread, or counts the jobs of
-// shared queues: a stuck queue has more jobs added than run, and the log names it if it keeps the
-// service from ending.
+// quality, which it starts when they are first needed. A job for which requests wait must not have
+// a lower quality than the requests. The label of a queue is the name of its own thread, or the
+// name under which the jobs of shared queues are counted. A stuck queue has more jobs added than
+// run; if it keeps the service from ending, the log names its label.
 //
-// Helping: the I/O thread, which delivers a batch of requests, does so between beginHelping() and
-// endHelping(). Brief jobs that it adds meanwhile to a queue with its own thread do not wake that
-// thread. At the end the I/O thread runs them itself, unless the queue's own thread is working or a
-// job that may block is in front of them. A brief request then costs no switch of threads. The
+// Helping: the I/O thread delivers a batch of requests between beginHelping() and endHelping().
+// Brief jobs that it adds in that time to a queue with a thread of its own do not wake that thread.
+// In endHelping() the I/O thread runs these jobs itself, unless the queue's own thread is working
+// or a job that may block is in front of them. A brief request then costs no switch of threads. The
 // queue stays serial and keeps the order of its jobs. docs/decisions/0002 has the reasons.
 //
 // Holding the pool: jobs that a thread adds to shared queues between holdPool() and wakePool()
-// start at wakePool(). Many jobs then wake the pool once, after the answers to the requests are
-// written. When each message woke the pool, the service took 1.61 times the processor time of a
-// bare echo; now it takes 1.07 times (docs/measurements.md). A queue with its own thread does the
-// same while it runs brief jobs.
+// start at wakePool(). Many jobs then wake the pool only once, after the answers to the requests
+// are written. When each message woke the pool, the service took 1.61 times the processor time of a
+// bare echo; now it takes 1.07 times (docs/measurements.md). The thread of a queue with its own
+// thread holds the pool, too, while it runs brief jobs.
 class AsioDispatchService final : public DispatchService {
  public:
-  // Both services must outlive this one and its queues. Throws std::system_error if the system has
-  // no threads or descriptors left.
+  // `log` and `statistics` must outlive this service and its queues. Throws std::system_error if
+  // the system has no threads or descriptors left.
   AsioDispatchService(LogService& log, StatisticsService& statistics);
   // Stops, and waits without a time limit for the running jobs to end.
   ~AsioDispatchService() override;
@@ -58,21 +58,21 @@ class AsioDispatchService final : public DispatchService {
   std::shared_ptr<DispatchSemaphore> createSemaphore(std::uint64_t signals) override;
   void asyncAfterOnBackgroundQueue(std::chrono::nanoseconds delay, Job job) override;
 
-  // These apply to the calling thread. Call the matching end on the same thread and soon: the jobs
-  // wait for it.
+  // These functions apply to the calling thread. After beginHelping() call endHelping(), and after
+  // holdPool() wakePool(), on the same thread and soon, because the jobs wait for that call.
   void beginHelping();
   void endHelping();
   void holdPool();
   void wakePool();
 
-  // Waits until the shared queues have run their jobs, at most for `limit`, so that an orderly end
-  // loses nothing. Does not wait for queues that wait on semaphores, nor for delayed jobs that are
-  // not due. Must not be called from a job.
+  // Waits until the shared queues have run their jobs, at most for `limit`. An orderly end calls
+  // this to lose nothing. Does not wait for queues that wait on semaphores, nor for delayed jobs
+  // that are not due. Must not be called from a job.
   void finish(std::chrono::milliseconds limit);
-  // Ends all threads after the jobs that they run. All other jobs, and those added later, are
-  // discarded and counted. Waits at most for `limit`. Returns false if a job still runs then. The
-  // log then names the queues, and the process should end without destroying this object. May be
-  // called again. Must not be called from a job.
+  // Ends each thread after the job that it runs. Discards and counts all other jobs, and those that
+  // are added later. Waits at most for `limit`. If a job still runs then, logs the labels of the
+  // stuck queues and returns false; the process should then end without destroying this object. May
+  // be called again. Must not be called from a job.
   bool stop(std::chrono::milliseconds limit);
 
  private:
@@ -85,7 +85,8 @@ class AsioDispatchService final : public DispatchService {
   const std::shared_ptr<DispatchPool> pool_;
   Mutex mutex_;
   bool isStopped_ HALVOX_GUARDED_BY(mutex_) = false;
-  // The queues whose thread may still run. Ended ones are removed when a new one is made.
+  // The queues whose threads may still run. Those whose threads have ended are removed when a new
+  // queue is made.
   std::vector<std::shared_ptr<OwnThreadQueue>> ownThreadQueues_ HALVOX_GUARDED_BY(mutex_);
 };
 

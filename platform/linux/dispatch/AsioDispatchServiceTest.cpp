@@ -187,7 +187,7 @@ TEST_F(AsioDispatchServiceTest, StopDiscardsWaitingJobsAndCountsThem) {
     EXPECT_TRUE(service.stop(kTestDeadline));
     releaser.join();
 
-    // The release may have come before the stop: every job either ran or was discarded.
+    // The release may have come before the stop. Either way, every job has run or was discarded.
     EXPECT_EQ(count("jobs discarded at the stop") - before + static_cast<std::uint64_t>(ran), 11U);
     EXPECT_TRUE(watched.expired());
   }

@@ -6,9 +6,9 @@
 
 namespace halvox::platform::linux_ {
 
-// One bit by which a slow consumer of messages asks the readers of connections to slow down the
-// busiest clients. The consumer (the store) raises and relieves it; any thread may read it. Owned
-// by the platform, which outlives both sides.
+// One bit with which a slow consumer of messages asks the connections to slow down the busiest
+// clients. The consumer (the store) raises and relieves it; any thread may read it. Owned by the
+// platform, which outlives the consumer and the connections.
 //
 //   low --raise()--> high --relieve(): calls the handler--> low
 class Backpressure {
@@ -17,7 +17,7 @@ class Backpressure {
   // block.
   void setReliefHandler(std::function<void()> handler) { onRelief_ = std::move(handler); }
 
-  // Relaxed: a reader that sees the bit late only reads a few more requests.
+  // Relaxed, because a connection that sees the bit late only reads a few more requests.
   [[nodiscard]] bool isHigh() const { return high_.load(std::memory_order_relaxed); }
   void raise() { high_.store(true, std::memory_order_relaxed); }
   void relieve() {

@@ -15,11 +15,12 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The clock ends 292 years after the start of the machine. A delay up to ten years cannot overflow.
+// The longest delay. The clock can count 292 years from the start of the machine, and adding at
+// most ten years to the current time cannot overflow.
 constexpr std::chrono::nanoseconds kLongestDelay = std::chrono::hours(24 * 3652);
 
-// CLOCK_MONOTONIC is what std::chrono::steady_clock reads, and its times can therefore be used
-// unchanged.
+// Uses CLOCK_MONOTONIC, which std::chrono::steady_clock reads, too. The times of steady_clock can
+// therefore be passed to the timer unchanged.
 int createTimer() {
   const int timer = ::timerfd_create(CLOCK_MONOTONIC, TFD_CLOEXEC | TFD_NONBLOCK);
   if (timer < 0) throw std::system_error(errno, std::generic_category(), "timerfd_create");
@@ -45,7 +46,7 @@ DelayedJobs::Ticket DelayedJobs::add(std::chrono::nanoseconds delay, QualityOfSe
     return ticket;
   }
   jobs_.emplace(ticket, Delayed{quality, std::move(job)});
-  // Set the timer only for a new earliest job, not for each job.
+  // Set the timer only if this job is the earliest one. This saves a system call for most jobs.
   if (!armedFor_.has_value() || due < *armedFor_) arm();
   return ticket;
 }
@@ -57,8 +58,9 @@ void DelayedJobs::cancel(const Ticket& ticket) {
   if (place == jobs_.end()) return;
   cancelled = std::move(place->second);
   jobs_.erase(place);
-  // A timer that is not needed any more would wake the idle service. The timer of a wait that had
-  // ended early once did, nine seconds after each start of a session.
+  // Set the timer again, because it would wake the idle service for nothing. Without this, each
+  // start of a session caused a wake-up nine seconds later, although its wait for back-ends had
+  // ended long before.
   if (jobs_.empty() || (armedFor_.has_value() && jobs_.begin()->first.first > *armedFor_)) arm();
 }
 
@@ -67,7 +69,8 @@ void DelayedJobs::stop() {
   {
     const MutexLock lock(mutex_);
     isStopped_ = true;
-    // Destroyed after the lock is released: what a job holds may add jobs.
+    // Destroy the jobs after the lock is released, because the destructor of an object that a job
+    // holds may add jobs.
     discarded.swap(jobs_);
     asio::error_code ignored;
     timer_.cancel(ignored);
@@ -99,7 +102,7 @@ void DelayedJobs::onTimer() {
   const MutexLock lock(mutex_);
   if (isStopped_) return;
   std::uint64_t expirations = 0;
-  // If the timer was set again after it had expired, there is nothing to read, and the timer will
+  // If the timer was set again after it had expired, there is nothing to read. The timer will
   // expire again.
   if (::read(timer_.native_handle(), &expirations, sizeof(expirations)) > 0) {
     const Time now = std::chrono::steady_clock::now();
@@ -120,7 +123,7 @@ void DelayedJobs::runDue(const Job& job) {
     const MutexLock lock(mutex_);
     isStopped = isStopped_;
   }
-  // The job was posted before the stop, but would only run after the stop.
+  // Discard the job if it was posted before the stop but would run after it.
   if (isStopped) return pool_.runner().countDiscarded(1);
   const DispatchThread::Working working(nullptr, "delayed");
   pool_.runner().run(job);

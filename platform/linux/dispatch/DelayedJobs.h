@@ -16,26 +16,29 @@ namespace halvox::platform::linux_ {
 
 class DispatchPool;
 
-// Jobs that run after a delay: any number of them, with one kernel timer and without a thread.
+// Runs jobs after a delay. Any number of jobs needs one kernel timer and no thread.
 //
-// The timer is always set for the earliest job and for nothing else. A wait that ends before its
-// time-out therefore causes no wake-up later. With Asio's own timers it did. The pool's utility
-// threads watch the timer, because background jobs, which may take long, must not delay it.
+// The timer is always set for the earliest job, and disabled if there is none. A wait that ends
+// before its time-out therefore causes no wake-up later. With Asio's own timers it did. The pool's
+// utility threads watch the timer. Background threads cannot, because their jobs may take long and
+// would delay it.
 //
 // Owned by the pool. Any thread may add jobs. Due jobs run on the pool's threads of their quality,
-// in no particular order relative to other jobs. The number of jobs has no bound: what waits is
-// charged to clients. No pool thread may run when this is destroyed.
+// in no particular order relative to other jobs. The number of jobs has no bound here, because
+// waiting messages are charged to the clients that sent them. No thread of the pool may run when
+// this object is destroyed.
 class DelayedJobs {
  public:
-  // A ticket names a job. Tickets are sorted by the time when the job is due, then by the order in
-  // which the jobs were added.
+  // A ticket identifies a job. Tickets are sorted by the time when the job is due, then by the
+  // order in which the jobs were added.
   using Time = std::chrono::steady_clock::time_point;
   using Ticket = std::pair<Time, std::uint64_t>;
 
   // Throws std::system_error if the system has no descriptor left.
   explicit DelayedJobs(DispatchPool& pool);
 
-  // Runs the job after the delay. A negative delay counts as 0, one above ten years as ten years.
+  // Runs the job after the delay. A negative delay counts as 0, a delay of more than ten years as
+  // ten years.
   Ticket add(std::chrono::nanoseconds delay, QualityOfService quality, Job job);
   // Destroys a job that is not due yet. Does nothing to a job that is about to run or has run.
   void cancel(const Ticket& ticket);

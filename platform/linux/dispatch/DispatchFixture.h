@@ -17,7 +17,7 @@
 
 namespace halvox::platform::linux_ {
 
-// A dispatch service whose log is in memory.
+// A fixture with a dispatch service that logs into memory.
 class DispatchFixture : public ::testing::Test {
  protected:
   DispatchFixture() {

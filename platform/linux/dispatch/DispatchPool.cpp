@@ -7,8 +7,8 @@ namespace halvox::platform::linux_ {
 
 DispatchPool::DispatchPool(std::shared_ptr<JobRunner> runner, StatisticsService& statistics)
     : runner_(std::move(runner)), labels_(statistics) {
-  // The utility threads watch the timer from the start. Those of other qualities are made when they
-  // are needed.
+  // Start the utility threads now, because they watch the timer. The threads of other qualities
+  // start when they are needed.
   if (!utility_.provide()) {
     throw std::system_error(std::make_error_code(std::errc::resource_unavailable_try_again),
                             "cannot start the threads of the queues");
@@ -20,9 +20,10 @@ DispatchPool::~DispatchPool() {
   static_cast<void>(waitForEnd(std::chrono::steady_clock::time_point::max()));
 }
 
-// A new thread starts with the priority of the thread that makes it. Only threads of at least
-// utility priority make background threads, because utility threads watch the timer. No thread
-// therefore gets a lower priority than its quality's.
+// Starts the threads of that quality if needed. A new thread begins with the priority of the thread
+// that starts it. Only threads of at least utility priority start background threads, because
+// utility threads watch the timer. No thread therefore begins with a lower priority than that of
+// its quality.
 asio::io_context& DispatchPool::context(QualityOfService quality) {
   switch (quality) {
     case QualityOfService::kUserInteractive:
@@ -36,7 +37,7 @@ asio::io_context& DispatchPool::context(QualityOfService quality) {
 }
 
 void DispatchPool::waitUntilIdle(std::chrono::steady_clock::time_point deadline) {
-  // Set this before the first look at turns_: from here on, the last turn that ends reports it.
+  // Set this before reading turns_. From here on, the last turn that ends calls reportIdle().
   isAwaited_.store(true);
   const MutexLock lock(mutex_);
   while (turns_.load() > 0 && idle_.waitUntil(mutex_, deadline)) {
@@ -50,8 +51,8 @@ void DispatchPool::reportIdle() {
 
 void DispatchPool::stop() {
   isStopped_.store(true, std::memory_order_relaxed);
-  // Stop the waits first, then the timers, then the threads: each could otherwise still give work
-  // to the next.
+  // Stop the waits first, then the delayed jobs, then the threads. In any other order, a part that
+  // still runs could give work to one that has stopped.
   waits_.stop();
   delayedJobs_.stop();
   for (PoolThreads* const threads : {&urgent_, &utility_, &background_}) threads->stop();
@@ -63,7 +64,8 @@ bool DispatchPool::waitForEnd(std::chrono::steady_clock::time_point deadline) {
 }
 
 void DispatchPool::discardJobs() {
-  // Each posted handler sees the stop and destroys its jobs without running them.
+  // Each entry of the run queues sees that the pool has stopped, and destroys its jobs without
+  // running them.
   for (PoolThreads* const threads : {&urgent_, &utility_, &background_}) threads->discardJobs();
   waits_.discard();
 }

@@ -17,9 +17,10 @@
 
 namespace halvox::platform::linux_ {
 
-// The threads on which all shared queues and delayed jobs run, a group for each quality of service.
-// The utility threads start with the pool, because they watch the timer. The others start with the
-// first job for them. If the system has no threads left, the utility threads do their work.
+// The threads on which all shared queues and delayed jobs run, in one group for each quality of
+// service. The utility threads start with the pool, because they watch the timer of the delayed
+// jobs. The other groups start with the first job for them. If the system cannot start their
+// threads, the utility threads run their jobs.
 //
 //   running --stop()--> stopping --waitForEnd()--> ended --discardJobs()--> empty
 //
@@ -34,17 +35,18 @@ class DispatchPool {
   // Stops, and waits for the running jobs.
   ~DispatchPool();
 
-  // The run queue of the threads of that quality. What is posted to it must itself check whether
-  // the pool has stopped.
+  // Returns the run queue of the threads of that quality. A handler that is posted to it must
+  // itself check whether the pool has stopped.
   [[nodiscard]] asio::io_context& context(QualityOfService quality);
   [[nodiscard]] JobRunner& runner() { return *runner_; }
   [[nodiscard]] QueueLabels& labels() { return labels_; }
   [[nodiscard]] DelayedJobs& delayedJobs() { return delayedJobs_; }
   [[nodiscard]] DispatchWaits& waits() { return waits_; }
-  // Relaxed: jobs that are added during the stop may be run or discarded.
+  // Relaxed, because a job that is added during the stop may be run or discarded.
   [[nodiscard]] bool isStopped() const { return isStopped_.load(std::memory_order_relaxed); }
 
-  // A queue reports each turn: when it requests the turn, and when it has nothing left to run.
+  // A queue calls beginTurn() when it requests a turn, and endTurn() when it has nothing left to
+  // run.
   void beginTurn() { turns_.fetch_add(1); }
   void endTurn() {
     if (turns_.fetch_sub(1) == 1 && isAwaited_.load()) reportIdle();
@@ -53,13 +55,14 @@ class DispatchPool {
   // queues that wait on semaphores, nor for delayed jobs that are not due.
   void waitUntilIdle(std::chrono::steady_clock::time_point deadline);
 
-  // Lets the threads end after the jobs that they run. From now on no wait ends.
+  // Lets each thread end after the job that it runs. From now on, no wait on a semaphore ends.
   void stop();
   // Waits for the end of the threads, at most until `deadline`. Returns false if a job still runs
   // then. Call after stop().
   bool waitForEnd(std::chrono::steady_clock::time_point deadline);
-  // Destroys the discarded jobs and the discarded waits. Needed because both may hold queues, which
-  // hold the pool. Call after waitForEnd() has returned true.
+  // Destroys the discarded jobs and waits. Without this call, jobs and waits that hold queues would
+  // keep the pool alive, because queues hold the pool. Call it after waitForEnd() has returned
+  // true.
   void discardJobs();
 
  private:

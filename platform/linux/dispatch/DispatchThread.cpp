@@ -8,9 +8,10 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// How many jobs one endHelping() runs before it leaves the others to the queues' own threads.
-// Helped jobs can add jobs; without a bound the I/O thread might never read a socket again. The
-// bound is far above what one turn of the loop delivers for a few clients, 64 requests each.
+// How many jobs one endHelping() runs before it leaves the others to the queues' own threads. These
+// jobs can add jobs, and without a bound the I/O thread might never read a socket again. The bound
+// is far above the number of requests that one turn of the loop delivers for a few clients, 64 for
+// each.
 constexpr std::size_t kHelpedJobsLimit = 1000;
 
 }  // namespace
@@ -21,21 +22,21 @@ DispatchThread& DispatchThread::current() {
 }
 
 DispatchThread::~DispatchThread() {
-  // End helping first, because helped jobs may add turns.
+  // End helping first, because the jobs that it runs may note turns.
   endHelping();
   wakePool();
 }
 
 void DispatchThread::endHelping() {
   std::size_t left = kHelpedJobsLimit;
-  // Loop by index: helped jobs can note further queues, which moves the elements.
+  // Use an index, because the jobs can note further queues, which moves the elements.
   for (std::size_t index = 0; index < queuesToHelp_.size(); ++index) {
     const std::shared_ptr<OwnThreadQueue> queue = std::move(queuesToHelp_[index]);
     left -= queue->help(*this, left);
   }
   queuesToHelp_.clear();
-  // Clear this after the loop: queues to which helped jobs add brief jobs are helped in the loop,
-  // too.
+  // Set this to false only after the loop. If a job in the loop adds a brief job to another queue,
+  // the loop then helps that queue, too.
   isHelping_ = false;
 }
 

@@ -12,15 +12,15 @@ namespace halvox::platform::linux_ {
 class OwnThreadQueue;
 class SharedQueue;
 
-// One thread, as the queues see it: which queue it works for, which queues it will help, and which
-// turns it holds back until its batch ends.
+// What the queues know about one thread: which queue it works for, which queues it will help, and
+// which turns of shared queues it holds back until its batch ends.
 //
-//   helping: off --beginHelping()--> on --endHelping(): runs the brief jobs it added--> off
+//   helping: off --beginHelping()--> on --endHelping(): runs the noted queues' brief jobs--> off
 //   holding: off --holdPool()--> on --wakePool(): begins the noted turns--> off
 //
-// This is the only thread-local of the adapter. It has to be one: the inner ring, which calls
-// DispatchQueue::async(), has no batch that it could pass. Belongs to its thread; no other thread
-// may touch it. When the thread ends, it ends helping and holding if they are still on.
+// This is the only thread-local object of the adapter. It must be thread-local because the inner
+// ring, which calls DispatchQueue::async(), has no batch that it could pass. Belongs to its thread;
+// no other thread may use it. When the thread ends, the destructor ends helping and holding.
 class DispatchThread {
  public:
   // Returns the calling thread's object.
@@ -31,11 +31,11 @@ class DispatchThread {
   DispatchThread& operator=(const DispatchThread&) = delete;
   ~DispatchThread();
 
-  // Marks the calling thread as working for `queue` (null: for none) while this object exists. May
-  // be nested.
+  // While this object exists, the calling thread is marked as working for `queue` (null: for no
+  // queue). May be nested.
   class Working {
    public:
-    // The caller owns `label`, which names the queue in the log.
+    // `label` names the queue in the log. The caller owns the text.
     Working(const DispatchQueue* queue, std::string_view label)
         : thread_(current()),
           outerQueue_(std::exchange(thread_.queue_, queue)),
@@ -57,17 +57,18 @@ class DispatchThread {
 
   [[nodiscard]] bool isHelping() const { return isHelping_; }
   void beginHelping() { isHelping_ = true; }
-  // Helps each noted queue, in the order of the notes. Includes the queues that helped jobs note.
+  // Helps the noted queues in the order in which they were noted, including those that are noted
+  // during this call.
   void endHelping();
   void noteQueueToHelp(std::shared_ptr<OwnThreadQueue> queue) {
     queuesToHelp_.push_back(std::move(queue));
   }
 
   [[nodiscard]] bool isHoldingPool() const { return isHoldingPool_; }
-  // A thread that holds the pool must not wait for its own jobs in the pool: the pool has not been
-  // woken for them.
+  // A thread that holds the pool must not wait for jobs that it has added to shared queues, because
+  // they start only at wakePool().
   void holdPool() { isHoldingPool_ = true; }
-  // Begins the noted turns, in the order of the notes.
+  // Begins the noted turns in the order in which they were noted.
   void wakePool();
   void noteTurn(std::shared_ptr<SharedQueue> queue) { turns_.push_back(std::move(queue)); }
 
@@ -76,7 +77,7 @@ class DispatchThread {
   std::string_view label_;  // owned by the maker of the innermost Working
   bool isHelping_ = false;
   bool isHoldingPool_ = false;
-  // Both keep their capacity between batches.
+  // Both lists keep their capacity between batches.
   std::vector<std::shared_ptr<OwnThreadQueue>> queuesToHelp_;
   std::vector<std::shared_ptr<SharedQueue>> turns_;
 };

@@ -24,8 +24,8 @@ void DispatchWaits::begin(std::shared_ptr<SharedQueue> queue,
     const MutexLock lock(mutex_);
     outcome = tryEnd(semaphore, timeout, wait);
   }
-  // Call it outside the lock: resume() takes the lock of the queue, and locks that are held one at
-  // a time need no order.
+  // Call resume() without our lock, because it takes the lock of the queue. If no thread holds two
+  // locks at a time, the locks need no order.
   if (outcome.has_value()) resume(std::move(wait), *outcome);
 }
 
@@ -40,8 +40,8 @@ std::optional<WaitOutcome> DispatchWaits::tryEnd(const std::shared_ptr<SharedSem
   if (!isStopped_ && timeout.has_value() && timeout->count() <= 0) return WaitOutcome::kTimedOut;
   const std::uint64_t number = begun_++;
   if (!isStopped_ && timeout.has_value()) {
-    // Hold the semaphore weakly: the wait keeps it alive, and the time-out of a wait that has ended
-    // must not.
+    // Use a weak reference to the semaphore. The wait keeps the semaphore alive; the time-out of a
+    // wait that has ended must not do so.
     wait.timeout = delayedJobs_.add(*timeout, QualityOfService::kUtility,
                                     [this, weakSemaphore = std::weak_ptr(semaphore), number] {
                                       timeOut(weakSemaphore, number);
@@ -80,7 +80,7 @@ void DispatchWaits::timeOut(const std::weak_ptr<SharedSemaphore>& weakSemaphore,
   Wait wait;
   {
     const MutexLock lock(mutex_);
-    // A signal may have ended the wait after the time-out became due.
+    // The wait may be gone: a signal may have ended it after the time-out became due.
     const auto place = semaphore->waits_.find(number);
     if (isStopped_ || place == semaphore->waits_.end()) return;
     wait = take(*semaphore, place);
@@ -88,7 +88,8 @@ void DispatchWaits::timeOut(const std::weak_ptr<SharedSemaphore>& weakSemaphore,
   resume(std::move(wait), WaitOutcome::kTimedOut);
 }
 
-// The caller must own the semaphore: its last wait may be its last owner.
+// The caller must hold a shared pointer to the semaphore. Removing the last wait may otherwise
+// destroy the semaphore.
 DispatchWaits::Wait DispatchWaits::take(SharedSemaphore& semaphore, Waits::iterator place) {
   Wait wait = std::move(place->second);
   semaphore.waits_.erase(place);
@@ -119,8 +120,8 @@ void DispatchWaits::discard() {
       semaphore->waits_.clear();
     }
   }
-  // Destroyed outside the lock, like `semaphores`: the objects that they hold may signal in their
-  // destructors.
+  // `discarded` and `semaphores` are destroyed without the lock, because the objects that they hold
+  // may signal in their destructors.
   runner_.countDiscarded(discarded.size());
   for (const Wait& wait : discarded) wait.queue->discardJobs();
 }

@@ -20,15 +20,16 @@ class DispatchPool;
 class SharedQueue;
 class SharedSemaphore;
 
-// The shared queues that wait on semaphores. A wait is an entry here and, if it has a time-out, a
-// delayed job. It takes no thread. Whichever ends it first, a signal or the time-out, removes both.
+// The shared queues that wait on semaphores. A wait takes no thread. It consists of an entry here
+// and, if it has a time-out, a delayed job. A signal or the time-out, whichever comes first, ends
+// the wait and removes the entry and the delayed job.
 //
 //   begin() --a signal is kept--> the queue continues
 //           --none--> waiting --signal() or time-out--> the queue continues
 //                             --discard()--> the queue's jobs are discarded
 //
-// Owned by the pool. Any thread may use it. One mutex serves all semaphores: waits are as rare as
-// starts and stops of sessions. The number of waits is bounded by the number of queues, because
+// Owned by the pool. Any thread may use it. One mutex is enough for all semaphores, because waits
+// are as rare as starts and stops of sessions. There are at most as many waits as queues, because
 // each queue has at most one.
 class DispatchWaits {
  public:
@@ -38,24 +39,25 @@ class DispatchWaits {
     Then then;
     std::optional<DelayedJobs::Ticket> timeout;
   };
-  // Sorted by number: the first wait began first.
+  // Waits by their numbers. The wait with the lowest number began first.
   using Waits = std::map<std::uint64_t, Wait>;
 
-  // Both must outlive this.
+  // `delayedJobs` and `runner` must outlive this object.
   DispatchWaits(DelayedJobs& delayedJobs, JobRunner& runner)
       : delayedJobs_(delayedJobs), runner_(runner) {}
 
-  // The queue must not run a job until its resume() is called. That can happen before this returns.
+  // Begins a wait of the queue. The queue must not run a job until its resume() is called, which
+  // can happen before begin() returns.
   void begin(std::shared_ptr<SharedQueue> queue, const std::shared_ptr<SharedSemaphore>& semaphore,
              std::optional<std::chrono::nanoseconds> timeout, Then then);
-  // Ends the wait that began first. If there is none, stores the signal.
+  // Ends the oldest wait of the semaphore. If there is none, stores the signal.
   void signal(SharedSemaphore& semaphore);
-  // Blocks the calling thread until a signal is stored, and consumes it. Waits of queues get
-  // signals first.
+  // Blocks the calling thread until a signal is stored, and consumes the signal. If queues wait,
+  // too, they get the signals first.
   void block(SharedSemaphore& semaphore);
   // From now on no wait ends.
   void stop();
-  // Destroys the waits, the objects that they hold, and the jobs of their queues. Call after
+  // Destroys the waits, the objects that they hold, and the jobs of their queues. Call it after
   // stop(), when no job runs any more.
   void discard();
 
@@ -73,12 +75,12 @@ class DispatchWaits {
   Mutex mutex_;
   bool isStopped_ HALVOX_GUARDED_BY(mutex_) = false;
   std::uint64_t begun_ HALVOX_GUARDED_BY(mutex_) = 0;
-  // The semaphores with waits. A wait keeps its semaphore alive.
+  // The semaphores on which queues wait. This set keeps them alive.
   std::unordered_set<std::shared_ptr<SharedSemaphore>> semaphores_ HALVOX_GUARDED_BY(mutex_);
 };
 
-// The signals that no wait has consumed yet, and the waits for the next ones. Shared by the code
-// that signals and the code that waits. Any thread may use it.
+// A semaphore: the signals that no wait has consumed yet, or the waits for further signals. Shared
+// by the code that signals and the code that waits. Any thread may use it.
 class SharedSemaphore final : public DispatchSemaphore,
                               public std::enable_shared_from_this<SharedSemaphore> {
  public:
@@ -92,7 +94,8 @@ class SharedSemaphore final : public DispatchSemaphore,
   friend class DispatchWaits;
 
   const std::shared_ptr<DispatchPool> pool_;
-  // Guarded by the mutex of the pool's DispatchWaits. One of the two is always empty.
+  // The following members are guarded by the mutex of the pool's DispatchWaits. There are never
+  // signals and waits at the same time.
   std::uint64_t signals_;
   DispatchWaits::Waits waits_;
   Condition signalled_;  // a signal was stored

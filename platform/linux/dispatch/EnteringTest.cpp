@@ -16,19 +16,19 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Long enough for a thread to do what it must not.
+// Long enough for a thread to do what must not happen.
 constexpr std::chrono::milliseconds kQuietTime{50};
 
 class EnteringTest : public DispatchFixture {
  protected:
-  // Waits until the queue has run everything that was added before.
+  // Waits until the queue has run all jobs that were added before this call.
   bool drain() {
     std::promise<void> done;
     auto ran = done.get_future();
     queue_->async(JobWeight::kMayBlock, [&done] { done.set_value(); });
     return ran.wait_for(kTestDeadline) == std::future_status::ready;
   }
-  // Waits until the last turn has ended, too.
+  // Also wait until the last turn has ended.
   bool enterEventually() {
     return eventually([this] { return static_cast<bool>(QueueEntry(*queue_)); });
   }

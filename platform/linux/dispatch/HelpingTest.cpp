@@ -1,4 +1,4 @@
-// Tests how a thread that delivers requests runs jobs of the queues to which it adds them.
+// Tests how a thread that delivers requests itself runs the jobs that it adds to queues.
 
 #include <algorithm>
 #include <array>
@@ -26,8 +26,8 @@ using ThreadIDs = std::vector<std::thread::id>;
 
 class HelpingTest : public ::testing::Test {
  protected:
-  // A queue whose own thread sleeps. A thread that is still starting looks for jobs by itself and
-  // may run one before the helper does.
+  // Returns a queue whose own thread sleeps. A thread that is still starting would look for jobs
+  // and might run one before the helper does.
   std::shared_ptr<DispatchQueue> createQueue() {
     auto queue =
         service_.createSerialQueue("q", QualityOfService::kUtility, QueueThreading::kOwnThread);
@@ -50,7 +50,7 @@ class HelpingTest : public ::testing::Test {
       return stat.has_value() && stat->state == 'S';
     });
   }
-  // A job that records the thread that runs it.
+  // Returns a job that records the thread that runs it.
   static Job noteThread(ThreadIDs& threads) {
     return [&threads] { threads.push_back(std::this_thread::get_id()); };
   }
@@ -259,8 +259,8 @@ TEST_F(HelpingTest, QueueDroppedWithinABatchRunsItsJobs) {
   EXPECT_EQ(ran.get_future().wait_for(kTestDeadline), std::future_status::ready);
 }
 
-// The jobs that one queue of the test below has run. Only its jobs touch it. It is not atomic, so
-// that ThreadSanitizer reports two jobs that run at once.
+// The jobs that one queue of the test below has run. Only the jobs of that queue use this record.
+// It is not atomic, because ThreadSanitizer must report two jobs that run at the same time.
 struct Record {
   static constexpr std::size_t kAdders = 6;
   std::array<int, kAdders> last{};
@@ -280,7 +280,8 @@ class HelpingTrial : public HelpingTest {
  protected:
   static constexpr int kJobs = 6000;
 
-  // Adds numbered jobs to both queues in turns, in batches of 1 to 17, every 13th one heavier.
+  // Adds numbered jobs, each to both queues, in batches of 1 to 17 numbers. Every 13th job may
+  // block.
   void add(std::size_t adder) {
     const bool isHelper = adder % 3 != 0;
     for (int number = 1; number <= kJobs;) {

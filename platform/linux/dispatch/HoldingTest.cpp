@@ -24,7 +24,8 @@ class HoldingTest : public ::testing::Test {
   static bool isSet(std::future<void>& event) {
     return event.wait_for(kTestDeadline) == std::future_status::ready;
   }
-  // Sends jobs of another thread through the whole pool, many times.
+  // Lets another thread add 100 jobs to a shared queue, each after the one before it has run.
+  // Returns false if one does not run in time.
   bool passJobs() {
     bool passed = true;
     std::thread other([this, &passed] {

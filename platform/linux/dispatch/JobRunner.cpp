@@ -20,7 +20,7 @@ void JobRunner::reportFailure() noexcept {
   } catch (const std::exception& exception) {
     what = exception.what();
   } catch (...) {
-    // It is not a std::exception and has no text.
+    // The exception is not a std::exception and has no text.
   }
   log_.write(LogLevel::kError, detail::logPrefix("JobRunner", __LINE__) + "a job of queue \"" +
                                    std::string(DispatchThread::current().label()) + "\" failed: " +

@@ -8,15 +8,15 @@
 
 namespace halvox::platform::linux_ {
 
-// Runs jobs for the queues and catches what they throw. Shared by all queues of a service, because
-// queues can outlive the service. Any thread may use it.
+// Runs jobs for the queues and catches the exceptions that they throw. Shared by a service and all
+// its queues, because queues can outlive the service. Any thread may use it.
 class JobRunner {
  public:
-  // Both services must outlive the runner.
+  // `log` and `statistics` must outlive the runner.
   JobRunner(LogService& log, StatisticsService& statistics);
 
-  // Runs one job. An exception is logged with the queue's label, counted and not passed on: one bad
-  // job must not stop the queue.
+  // Runs one job. If the job throws, logs the exception with the queue's label and counts it. Does
+  // not pass it on, because one bad job must not stop the queue.
   void run(const Job& job) noexcept {
     try {
       job();

@@ -8,8 +8,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The number of jobs for which an idle queue keeps room. A queue that once had more gives the
-// memory back.
+// The number of jobs for which an idle queue keeps memory. A queue that once had more jobs frees
+// the rest.
 constexpr std::size_t kKeptCapacity = 4096;
 
 }  // namespace
@@ -43,10 +43,10 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
       return;  // the job is destroyed with the arguments, after the lock has been released
     }
     waiting_.push_back({std::move(job), weight});
-    if (hasWorker_) return;  // the worker looks for new jobs before it ends its work
+    if (hasWorker_) return;  // the worker looks for new jobs before it stops working
     // The helper has noted this queue already and will find the job.
     if (mayHelp && helper_ == &helper) return;
-    // There is only one helper at a time. For a job of a second thread, wake the own thread.
+    // A queue has only one helper at a time. If a second thread adds a job, wake the own thread.
     isNewForHelper = mayHelp && helper_ == nullptr;
     if (isNewForHelper) {
       helper_ = &helper;
@@ -54,7 +54,7 @@ void OwnThreadQueue::async(JobWeight weight, Job job) {
       mustWake = takeWakeUp();
     }
   }
-  // Do both after the lock is released: a thread that wakes up needs the lock at once.
+  // Do this after the lock is released, because a thread that wakes up needs the lock at once.
   if (isNewForHelper) helper.noteQueueToHelp(shared_from_this());
   if (mustWake) wakeUp_.notifyOne();
 }
@@ -77,7 +77,8 @@ void OwnThreadQueue::stop() {
     const MutexLock lock(mutex_);
     life_ = Life::kStopped;
     isStopped_.store(true, std::memory_order_relaxed);
-    // Destroyed after the lock is released: what a job holds may add jobs to this queue.
+    // Destroy the jobs after the lock is released, because the destructor of an object that a job
+    // holds may add jobs to this queue.
     discarded.swap(waiting_);
     wakeUp_.notifyOne();
   }
@@ -111,8 +112,8 @@ void OwnThreadQueue::work(DispatchThread& thread) {
     while (takeBatch()) {
       mutex_.unlock();
       while (canGoOn()) runNextInBatch(thread);
-      // Wake the pool at the end of each batch. This thread may sleep now, and must not hold back
-      // turns meanwhile.
+      // Wake the pool at the end of each batch. This thread may sleep next, and must not hold back
+      // turns while it sleeps.
       thread.wakePool();
       mutex_.lock();
     }
@@ -120,8 +121,9 @@ void OwnThreadQueue::work(DispatchThread& thread) {
   }
 }
 
-// Consecutive brief jobs wake the pool once. Before a job that may block, wakes the pool: the job
-// may wait for work that an earlier job gave to the pool.
+// Runs the next job. Consecutive brief jobs wake the pool only once, after the last of them. The
+// pool is also woken before a job that may block, because that job may wait for jobs that an
+// earlier one has added to shared queues.
 void OwnThreadQueue::runNextInBatch(DispatchThread& thread) {
   if (batch_[next_].weight == JobWeight::kBrief) {
     thread.holdPool();
@@ -143,7 +145,7 @@ void OwnThreadQueue::end() {
 // Waits until there are jobs and no other worker. Returns false if the thread should end.
 bool OwnThreadQueue::waitForWork() {
   while (hasWorker_ || !hasWork()) {
-    // Do not end while a helper works. It wakes this thread when it has finished.
+    // Do not end while a helper works. The helper wakes this thread when it has finished.
     if (!hasWorker_ && life_ != Life::kOpen) return false;
     sleeps_ = true;
     wakeUp_.wait(mutex_);
@@ -158,8 +160,8 @@ std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit
   bool mustWake = false;
   {
     const MutexLock lock(mutex_);
-    // Clear this first: a job that is added from now on must note the queue again or wake its
-    // thread.
+    // Clear `helper_` first. If this thread adds a job from now on, it must note the queue again or
+    // wake the own thread.
     if (helper_ == &helper) helper_ = nullptr;
     if (hasWorker_ || !hasWork()) return 0;
     hasWorker_ = true;
@@ -171,12 +173,12 @@ std::size_t OwnThreadQueue::help(const DispatchThread& helper, std::size_t limit
         ++done;
       }
       mutex_.lock();
-      // If jobs of this batch are left, those that were added meanwhile must wait for them.
+      // If jobs of this batch are left, do not take newer jobs, because they must run after those.
       isFront = next_ == batch_.size();
     }
     hasWorker_ = false;
-    // After close() or stop(), wake the own thread even without work: it may be waiting for this
-    // helper to finish.
+    // After close() or stop(), wake the own thread even if there is no work, because it may be
+    // waiting for this helper to finish.
     mustWake = (hasWork() || life_ != Life::kOpen) && takeWakeUp();
   }
   if (mustWake) wakeUp_.notifyOne();
@@ -187,21 +189,21 @@ bool OwnThreadQueue::hasWork() const {
   return life_ != Life::kStopped && (!waiting_.empty() || next_ < batch_.size());
 }
 
-// Moves the waiting jobs into the batch, unless the batch still has jobs. Returns false if there
-// are none to run.
+// Moves the waiting jobs into the batch, unless the batch still has jobs. Returns false if there is
+// no job to run.
 bool OwnThreadQueue::takeBatch() {
   if (!hasWork()) return false;
   if (next_ < batch_.size()) return true;
   batch_.clear();
   next_ = 0;
-  // Shrink before the swap, which makes this empty vector the one to which jobs are added next.
+  // Shrink before the swap, because the next jobs are added to this vector.
   if (batch_.capacity() > kKeptCapacity) batch_.shrink_to_fit();
   batch_.swap(waiting_);
   return true;
 }
 
-// Returns true if the caller must notify the own thread: it sleeps, and no other thread is waking
-// it.
+// Returns true if the caller must notify the own thread, because it sleeps and no other thread has
+// woken it yet.
 bool OwnThreadQueue::takeWakeUp() { return std::exchange(sleeps_, false); }
 
 bool OwnThreadQueue::canGoOn() const {
@@ -209,8 +211,8 @@ bool OwnThreadQueue::canGoOn() const {
 }
 
 void OwnThreadQueue::runNext() {
-  // Move the job out first. What it holds is then released as soon as it has run: a request's token
-  // must not wait for the end of the batch.
+  // Move the job out of the batch. The objects that it holds, such as a request's token, are then
+  // released when the job has run and not only at the end of the batch.
   const Job job = std::move(batch_[next_++].job);
   runner_->run(job);
 }

@@ -18,21 +18,21 @@
 
 namespace halvox::platform::linux_ {
 
-// A serial queue with a thread of its own, whose brief jobs another thread may run too.
+// A serial queue with a thread of its own. Another thread may run its brief jobs, too.
 //
-// Helping exists because crossing threads twice costs a request two wake-ups, as many as a bare
-// echo of the request needs in all (docs/decisions/0002). A thread that runs jobs, the own thread
-// or a helper, first becomes the queue's worker. There is at most one worker, which is what makes
-// the queue serial. The worker takes all waiting jobs in one batch: a batch costs one lock, and two
-// vectors that keep their capacity. A worker that leaves jobs in the queue wakes the own thread. No
-// job is therefore forgotten:
+// Another thread may help because a request that crosses to the own thread and back costs two
+// wake-ups, as many as a bare echo of the request needs in all (docs/decisions/0002). A thread that
+// runs jobs, the own thread or a helper, first becomes the queue's worker. There is at most one
+// worker at a time, which makes the queue serial. The worker takes all waiting jobs in one batch,
+// because a batch needs the lock only once. A worker that leaves jobs in the queue wakes the own
+// thread. No job is therefore forgotten:
 //
 //   no worker --takes a batch--> worker --no job is left--> no worker
 //                                   \--the limit, or a job that may block, is reached-->
 //                                                   no worker, the own thread is woken
 //
-// Any thread may add jobs. The number of jobs has no bound here: the connections stop reading from
-// clients that have too many open requests.
+// Any thread may add jobs. The number of jobs has no bound here, because the connections stop
+// reading from clients that have too many open requests.
 //
 //   open --close()--> closed: runs its jobs --> ended
 //     \----stop()---> stopped: discards and counts them --> ended
@@ -46,7 +46,7 @@ class OwnThreadQueue final : public DispatchQueue,
   ~OwnThreadQueue() override;
 
   void async(JobWeight weight, Job job) override;
-  // Throws std::logic_error, which fails the job: only shared queues can wait.
+  // Throws std::logic_error, which makes the calling job fail. Only shared queues can wait.
   void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
               std::optional<std::chrono::nanoseconds> timeout,
               std::function<void(WaitOutcome)> then) override;
@@ -58,7 +58,7 @@ class OwnThreadQueue final : public DispatchQueue,
   // Lets the thread end after the job that is running. Discards the waiting jobs and those that are
   // added later.
   void stop();
-  // Returns true once the thread has done its last work: joining it then takes no time.
+  // Returns true if the thread has finished its work. Joining it then takes no time.
   [[nodiscard]] bool hasEnded() const;
   // Waits for the end of the thread, at most until `deadline`. Returns false if it has not ended by
   // then.
@@ -97,20 +97,20 @@ class OwnThreadQueue final : public DispatchQueue,
   Condition ended_;
   std::vector<Item> waiting_ HALVOX_GUARDED_BY(mutex_);
   bool hasWorker_ HALVOX_GUARDED_BY(mutex_) = false;
-  // The own thread waits and has not been woken yet. The thread that wakes it clears this first:
-  // many jobs cost one wake-up.
+  // True while the own thread waits and has not been woken. The thread that wakes it clears this
+  // first, and further jobs then cost no wake-up.
   bool sleeps_ HALVOX_GUARDED_BY(mutex_) = false;
   Life life_ HALVOX_GUARDED_BY(mutex_) = Life::kOpen;
   bool hasEnded_ HALVOX_GUARDED_BY(mutex_) = false;
-  // The thread that will help with the jobs that it added. While it is set, its jobs do not wake
-  // the own thread.
+  // The thread that will help this queue, or null. Brief jobs that it adds do not wake the own
+  // thread.
   const DispatchThread* helper_ HALVOX_GUARDED_BY(mutex_) = nullptr;
-  // Relaxed, because `life_` decides. This only ends a batch early without taking the lock for each
-  // job.
+  // Lets the worker end a batch early without taking the lock for each job. Relaxed, because
+  // `life_` decides.
   std::atomic<bool> isStopped_{false};
 
-  // These belong to the worker. A thread becomes the worker under the mutex, which orders its use
-  // of them after that of the previous worker.
+  // The batch belongs to the worker. A thread becomes the worker under the mutex, and the mutex
+  // orders its use of the batch after that of the previous worker.
   std::vector<Item> batch_;
   std::size_t next_ = 0;
 

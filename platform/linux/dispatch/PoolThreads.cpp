@@ -38,7 +38,8 @@ bool PoolThreads::provide() {
   } catch (const std::system_error&) {
     if (threads_.empty()) return false;
   }
-  // Set this even with one thread: do not try to start a second one for each job.
+  // Set this even if only one thread could be started. Otherwise each job would try to start the
+  // second one.
   areThere_.store(true, std::memory_order_relaxed);
   return true;
 }
@@ -64,16 +65,17 @@ void PoolThreads::join() {
   std::vector<std::thread> threads;
   {
     const MutexLock lock(mutex_);
-    // Join them after the lock is released: each thread takes the lock in its last step.
+    // Join the threads after the lock is released, because each thread takes the lock in its last
+    // step.
     threads.swap(threads_);
   }
   for (std::thread& thread : threads) thread.join();
 }
 
 void PoolThreads::discardJobs() {
-  // Remove the work guard: poll() then returns when the run queue is empty.
+  // Remove the work guard. poll() then returns when the run queue is empty.
   work_.reset();
-  // A context that was stopped runs nothing.
+  // A stopped context runs nothing before restart().
   context_.restart();
   context_.poll();
 }

@@ -15,9 +15,9 @@
 
 namespace halvox::platform::linux_ {
 
-// The pool's threads of one quality of service. There are two, so that one job that blocks does not
-// hold up all others. They keep the scheduling priority of their quality: lowering a thread's
-// priority needs no privilege, but raising it again does.
+// The pool's threads of one quality of service. There are two threads, because with one thread a
+// job that blocks would hold up all others. They always keep the scheduling priority of their
+// quality: lowering a thread's priority needs no privilege, but raising it again does.
 //
 //   no threads --provide()--> running --stop()--> stopping --waitForEnd()--> ended
 //
@@ -30,20 +30,21 @@ class PoolThreads {
   // Stops, and waits for the running jobs.
   ~PoolThreads();
 
-  // Their run queue. What is posted before there are threads waits in it.
+  // Returns the run queue of the threads. Jobs that are posted before the threads start wait in it.
   [[nodiscard]] asio::io_context& context() { return context_; }
-  // Starts the threads unless they run. One is enough if the system refuses the second. Returns
-  // false if it refuses both, and after stop(). The caller must not have a lower priority than this
-  // quality: a new thread starts with the priority of the thread that makes it.
+  // Starts the threads unless they run. If the system refuses the second thread, one is enough.
+  // Returns false if the system refuses both, or after stop(). The calling thread must not have a
+  // lower priority than this quality, because a new thread starts with the priority of the thread
+  // that makes it.
   bool provide() HALVOX_EXCLUDES(mutex_);
 
-  // Lets the threads end after the jobs that they run.
+  // Lets each thread end after the job that it runs.
   void stop() HALVOX_EXCLUDES(mutex_);
   // Waits for the end of the threads, at most until `deadline`. Returns false if a job still runs
   // then. Call after stop().
   bool waitForEnd(std::chrono::steady_clock::time_point deadline) HALVOX_EXCLUDES(mutex_);
-  // Runs what is left in the run queue; each entry sees the stop and discards its jobs. Call after
-  // waitForEnd() has returned true.
+  // Runs the remaining entries of the run queue. Each entry sees that the pool has stopped, and
+  // discards its jobs. Call it after waitForEnd() has returned true.
   void discardJobs();
 
  private:

@@ -28,8 +28,8 @@ using ::testing::HasSubstr;
 
 int nicenessHere() { return ::getpriority(PRIO_PROCESS, static_cast<id_t>(::gettid())); }
 
-// Returns the niceness of a thread that many steps below this one. The tests may themselves run at
-// a low priority.
+// Returns the niceness of a thread that is `steps` below this thread, because the tests may
+// themselves run at a low priority.
 int stepsBelow(int steps) { return std::min(nicenessHere() + steps, 19); }
 
 bool hasThreadNamed(const std::string& name) {

@@ -11,7 +11,7 @@ QueueLabel& QueueLabels::label(std::string_view text) {
                          .try_emplace(name, statistics_.counter(kPiece, name + ": jobs added"),
                                       statistics_.counter(kPiece, name + ": jobs run"))
                          .first;
-  // A view of the key is enough: a map does not move its keys.
+  // A view of the key is enough, because a map does not move its keys.
   place->second.text = place->first;
   return place->second;
 }

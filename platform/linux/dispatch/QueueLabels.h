@@ -11,28 +11,28 @@
 
 namespace halvox::platform::linux_ {
 
-// What the shared queues with one label have in common. It helps to find a stuck queue, whose label
-// counts more jobs added than run.
+// The data that the shared queues with one label share. It helps to find a stuck queue, whose label
+// has more jobs added than run.
 struct QueueLabel {
   QueueLabel(Counter& addedJobs, Counter& ranJobs) : added(addedJobs), run(ranJobs) {}
 
   std::string_view text{};  // owned by the QueueLabels
   Counter& added;
   Counter& run;
-  // How many of the queues have a turn. Relaxed: it is only read to name stuck queues.
+  // How many of the queues have a turn now. Relaxed, because it is read only to name stuck queues.
   std::atomic<int> atWork{0};
 };
 
-// The labels of the shared queues, one for each text. Labels are never removed: their texts are
-// constants of the code, which all sessions share. Owns the labels; belongs to the pool. Any thread
-// may use it.
+// The labels of the shared queues, one for each text. Labels are never removed. They stay few,
+// because their texts are constants of the code, and the queues of all sessions share them. Owns
+// the labels. Owned by the pool. Any thread may use it.
 class QueueLabels {
  public:
   // `statistics` must outlive this.
   explicit QueueLabels(StatisticsService& statistics) : statistics_(statistics) {}
 
-  // Returns the label with that text. Makes it at the first call. Valid as long as this object
-  // exists.
+  // Returns the label with that text, and makes it at the first call. The label is valid as long as
+  // this object exists.
   QueueLabel& label(std::string_view text) HALVOX_EXCLUDES(mutex_);
   // Returns the texts of the labels that have a queue with a turn.
   [[nodiscard]] std::vector<std::string> atWork() HALVOX_EXCLUDES(mutex_);

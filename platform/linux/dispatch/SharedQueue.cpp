@@ -10,7 +10,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Counts a queue as having a turn while this object exists.
+// While this object exists, its label counts one more queue that has a turn.
 class AtWork {
  public:
   explicit AtWork(QueueLabel& label) : label_(label) {
@@ -38,8 +38,8 @@ void SharedQueue::async(JobWeight /*weight*/, Job job) {
     label_.added.add();
     if (hasTurn_ || isWaiting_) return;
     hasTurn_ = true;
-    // Report the turn under the lock: a pool that is asked whether it is idle must count this job's
-    // turn from now on.
+    // Report the turn under the lock. From the moment when the job is in the queue, waitUntilIdle()
+    // must count its turn.
     pool_->beginTurn();
   }
   askForTurn();
@@ -49,7 +49,7 @@ bool SharedQueue::tryEnter() {
   if (pool_->isStopped()) return false;
   {
     const MutexLock lock(mutex_);
-    // A turn that runs or was asked for has work that comes first.
+    // If the queue has a turn, or will have one after a wait, earlier jobs come first.
     if (hasTurn_ || isWaiting_) return false;
     hasTurn_ = true;
     pool_->beginTurn();
@@ -72,7 +72,7 @@ void SharedQueue::leave() {
       return;
     }
   }
-  // Jobs that were added meanwhile have found a turn and did not ask for one.
+  // Jobs that were added since tryEnter() did not ask for a turn, because the queue had one.
   askForTurn();
 }
 
@@ -89,19 +89,19 @@ void SharedQueue::waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
     if (isWaiting_) throw std::logic_error("a job called waitOn() a second time");
     isWaiting_ = true;
   }
-  // Call this without the lock: a stored signal ends the wait at once, and resume() takes the lock.
+  // Call begin() without the lock. If a signal is stored, begin() calls resume() at once, which
+  // takes the lock.
   pool_->waits().begin(shared_from_this(), shared, timeout, std::move(then));
 }
 
 void SharedQueue::resume(Job then) {
   {
     const MutexLock lock(mutex_);
-    // Add it in front: the job that follows the wait comes before the jobs that were added during
-    // the wait.
+    // Add `then` in front, because it comes before the jobs that were added during the wait.
     jobs_.push_front(std::move(then));
     label_.added.add();
     isWaiting_ = false;
-    // The job that began the wait may not have returned yet. Its turn then runs `then`.
+    // The job that began the wait may still be running. Its turn then runs `then`, too.
     if (hasTurn_) return;
     hasTurn_ = true;
     pool_->beginTurn();
@@ -111,7 +111,8 @@ void SharedQueue::resume(Job then) {
 
 void SharedQueue::askForTurn() {
   DispatchThread& thread = DispatchThread::current();
-  // A thread of the pool that is woken for each message costs more than the rest of the message.
+  // Only note the turn while this thread holds the pool. Waking a thread of the pool for each
+  // message costs more than all other work for the message.
   if (thread.isHoldingPool()) return thread.noteTurn(shared_from_this());
   beginTurn();
 }
@@ -128,11 +129,12 @@ void SharedQueue::runTurn() {
     if (pool_->isStopped()) return discardJobs();
     if (!runNext()) return;
   }
-  // Go back to the end of the run queue although jobs remain: other queues wait for this thread.
+  // Jobs remain. Continue in a new turn at the end of the run queue, because other queues wait for
+  // this thread.
   beginTurn();
 }
 
-// Returns false if there is nothing to run. The turn has then ended.
+// Runs one job. If there is none to run, ends the turn and returns false.
 bool SharedQueue::runNext() {
   Job job;
   {
@@ -146,7 +148,8 @@ bool SharedQueue::runNext() {
     jobs_.pop_front();
   }
   pool_->runner().run(job);
-  // Count after the job: a queue that is stuck in a job then has more jobs added than run.
+  // Count the job after it has run. A queue that is stuck in a job then has more jobs added than
+  // run.
   label_.run.add();
   return true;
 }
@@ -157,7 +160,8 @@ void SharedQueue::discardJobs() {
     const MutexLock lock(mutex_);
     if (hasTurn_) pool_->endTurn();
     hasTurn_ = false;
-    // Destroyed after the lock is released: what a job holds may add jobs to this queue.
+    // Destroy the jobs after the lock is released, because the destructor of an object that a job
+    // holds may add jobs to this queue.
     discarded.swap(jobs_);
   }
   if (!discarded.empty()) pool_->runner().countDiscarded(discarded.size());

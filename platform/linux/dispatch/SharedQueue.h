@@ -25,21 +25,22 @@ class DispatchPool;
 //                        v    |
 //                       waiting
 //
-// A thread that enters an idle queue has a turn too, on that thread and without the pool.
+// A thread that enters an idle queue (tryEnter()) also has its turn. That turn runs on the entering
+// thread and not in the pool.
 //
-// A turn is one entry in the pool's run queue, however many jobs the queue has. At most one turn
-// exists at a time, which is what makes the queue serial.
+// A turn is one entry in the pool's run queue, however many jobs the queue has. A queue has at most
+// one turn at a time, which makes it serial.
 // Shared by its holders, its turn and its wait. Any thread may add jobs. The number of jobs has no
-// bound: what sessions add is charged to clients. Jobs added after the pool has stopped are
-// discarded and counted.
+// bound here, because the jobs that sessions add are charged to clients. Jobs that are added after
+// the pool has stopped are discarded and counted.
 class SharedQueue final : public DispatchQueue, public std::enable_shared_from_this<SharedQueue> {
  public:
   SharedQueue(std::shared_ptr<DispatchPool> pool, std::string_view label, QualityOfService quality);
 
-  // The weight does not matter here: pool threads may block.
+  // Ignores the weight, because threads of the pool may block.
   void async(JobWeight weight, Job job) override;
-  // Throws std::logic_error, which fails the job, when called outside the jobs of the queue, twice
-  // by one job, or with a semaphore of another service.
+  // Throws std::logic_error, which makes the calling job fail, if it is called outside the jobs of
+  // the queue, twice by one job, or with a semaphore of another service.
   void waitOn(std::shared_ptr<DispatchSemaphore> semaphore,
               std::optional<std::chrono::nanoseconds> timeout,
               std::function<void(WaitOutcome)> then) override;
@@ -47,7 +48,8 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
   void leave() override;
   [[nodiscard]] bool isCurrent() const override { return DispatchThread::current().worksFor(this); }
 
-  // Ends the wait: the queue continues with this job, then with those that were added meanwhile.
+  // Ends the wait. The queue continues with `then`, and after it with the jobs that were added
+  // during the wait.
   void resume(Job then);
   // Puts the requested turn into the pool's run queue.
   void beginTurn();
@@ -55,7 +57,7 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
   void discardJobs();
 
  private:
-  // How many jobs one turn runs before other queues get theirs.
+  // How many jobs one turn runs before other queues get their turns.
   static constexpr int kJobsPerTurn = 64;
 
   void askForTurn();
@@ -69,7 +71,7 @@ class SharedQueue final : public DispatchQueue, public std::enable_shared_from_t
   std::deque<Job> jobs_ HALVOX_GUARDED_BY(mutex_);
   bool hasTurn_ HALVOX_GUARDED_BY(mutex_) = false;  // a turn is noted, queued or running
   bool isWaiting_ HALVOX_GUARDED_BY(mutex_) = false;
-  // The thread that has entered. Only it touches this, and only while it has the turn.
+  // Set while a thread has entered the queue. Only that thread uses this member.
   std::optional<DispatchThread::Working> entered_;
 };
 

@@ -5,7 +5,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The priority of a thread that does work of this quality of service.
+// Returns the priority of a thread that runs jobs of this quality of service.
 [[nodiscard]] constexpr ThreadPriority priorityFor(QualityOfService quality) {
   switch (quality) {
     case QualityOfService::kUserInteractive:
