@@ -125,7 +125,7 @@ class KernelTraceTest(unittest.TestCase):
             self.assertGreater(lost, 0)
             self.assertEqual(lost + delivered, events)
             self.assertEqual(len(values["Shared"]), delivered // 2)
-            self.assertIn(f"no room for {lost} events and 0 packets of a kernel trace",
+            self.assertIn(f"lost {lost} events and 0 packets of a kernel trace",
                           service.log())
 
     def test_service_that_was_killed_is_cleaned_up_after(self):

@@ -29,8 +29,8 @@ int priority(LogLevel level) {
   return LOG_ERR;
 }
 
-// Sends each line as one entry of named fields. Entries go into the buffer of journald's socket:
-// write() blocks only while journald itself hangs. finish() needs no action.
+// Sends each line as one entry of named fields. Entries go into the buffer of journald's socket.
+// write() therefore blocks only while journald itself hangs, and finish() does nothing.
 class JournalLogSink final : public LogSink {
  public:
   explicit JournalLogSink(JournalSender sender) : sender_(std::move(sender)) {}
@@ -79,7 +79,8 @@ bool isJournalStream(int descriptor) {
   const auto second = std::from_chars(first.ptr + 1, end, inode);
   if (second.ec != std::errc{} || second.ptr != end) return false;
   struct stat status {};
-  // Programs also inherit the variable if their standard error is something else, such as a file.
+  // Compare the file with the one that the variable names: programs also inherit the variable if
+  // their standard error is something else, such as a file.
   return ::fstat(descriptor, &status) == 0 && status.st_dev == device && status.st_ino == inode;
 }
 

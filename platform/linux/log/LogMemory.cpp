@@ -42,8 +42,8 @@ LogMemory::Contents LogMemory::contents() const {
   std::vector<Line> lines;
   std::string ring;
   Contents contents;
-  // Reserve room for the largest contents before taking the lock: threads that log must not wait
-  // for an allocation.
+  // Allocate memory for the largest contents before taking the lock, because threads that log must
+  // not wait for an allocation.
   lines.reserve(bounds_.lines);
   ring.reserve(bounds_.bytes);
   {
@@ -55,7 +55,8 @@ LogMemory::Contents LogMemory::contents() const {
     contents.added = endLine_;
   }
   contents.lines = lines.size();
-  // Format after releasing the lock: formatting 10,000 lines takes longer than copying them.
+  // Format after releasing the lock, because formatting 10,000 lines takes longer than copying
+  // them.
   LogLineFormatter formatter;
   for (const Line& line : lines) {
     contents.text += formatter.format({.time = line.time,

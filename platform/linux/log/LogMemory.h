@@ -38,8 +38,8 @@ class LogMemory {
   // Keeps `line`, which may be the start of a text of `entry.wholeLength` bytes; cuts it at
   // `bounds.bytes`. Ignores `entry.text`. The names in the entry must live as long as the log.
   void add(const LogEntry& entry, std::string_view line);
-  // The kept lines, oldest first. Copies them under the lock and formats the copies after it, so
-  // that a capture does not delay threads that log.
+  // The kept lines, oldest first. Copies them under the lock and formats the copies after releasing
+  // it, so that a capture does not delay threads that log.
   [[nodiscard]] Contents contents() const;
 
  private:
@@ -57,7 +57,8 @@ class LogMemory {
   const LogLevel level_;
   const Bounds bounds_;
   mutable Mutex mutex_;
-  // Both have their full address range from the start; the kernel provides memory as lines arrive.
+  // Both reserve their whole address range at the start. The kernel provides the memory only as
+  // lines arrive.
   std::vector<Line> lines_ HALVOX_GUARDED_BY(mutex_);  // a ring once it is full
   std::unique_ptr<char[]> ring_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t firstLine_ HALVOX_GUARDED_BY(mutex_) = 0;

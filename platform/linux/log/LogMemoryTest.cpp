@@ -77,7 +77,8 @@ TEST(LogMemoryTest, OldestLinesMakeRoomWhenTheBytesAreUsedUp) {
 
   for (const char* line : {"aaaa", "bbbb", "cccc"}) add(memory, line);
 
-  // The third text overwrites the first, at the start of the ring; the second stays as it is.
+  // The third text overwrites the first one at the start of the ring. The second one stays as it
+  // is.
   EXPECT_THAT(words(memory), ElementsAre("bbbb", "cccc"));
 }
 

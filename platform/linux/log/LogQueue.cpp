@@ -5,10 +5,12 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Bytes, with the entries: about 5,000 lines of 100 bytes. Errors may use kRoomForErrors beyond it.
+// Bytes of texts and entries: about 5,000 lines of 100 bytes. Errors may use another kRoomForErrors
+// bytes.
 constexpr std::size_t kRoom = 1U << 20U;
 constexpr std::size_t kRoomForErrors = 256U << 10U;
-// Entries whose memory is kept between two batches. A burst must not hold its memory for ever.
+// The number of entries whose memory is kept between two batches. The memory of a larger burst is
+// freed.
 constexpr std::size_t kKeptCapacity = 256;
 
 }  // namespace
@@ -38,7 +40,8 @@ bool LogQueue::take(std::vector<LogEntry>& entries) {
     if (hasEnded_) return false;
     wakeUp_.wait(mutex_);
   }
-  // Take all lines at once: the lock is held only for a moment, however long writing them takes.
+  // Take all lines at once. The lock is then held only for a moment, however long it takes to write
+  // them.
   entries.swap(entries_);
   bytes_ = 0;
   return true;

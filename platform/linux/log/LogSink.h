@@ -18,7 +18,7 @@ class LogSink {
   // Writes the lines in order; returns how many were written. Waits for a slow reader without
   // limit, and for about one more second after finish() was called.
   virtual std::size_t write(std::span<const LogEntry> entries) = 0;
-  // Bounds the waiting of write(). May be called during write().
+  // Limits how long write() waits from now on. May be called during write().
   virtual void finish() = 0;
 };
 

@@ -34,7 +34,7 @@ class QueuedLogService::Category final : public LogCategory {
       service_.memory_->add(entry, start);
     }
     if (level < service_.levels_.written) return;
-    // Copy the text only now: a line that is not written needs none.
+    // Copy the text only now, because a line that is not written needs no copy.
     entry.text = start;
     service_.add(std::move(entry));
   }
@@ -76,8 +76,8 @@ LogCategory& QueuedLogService::createCategory(std::string_view subsystem,
 }
 
 void QueuedLogService::stop() {
-  // In this order, the thread writes what is queued, and waits one more second for a reader that
-  // does not read.
+  // Call end() before finish(): the thread then still writes the queued lines, and finish() limits
+  // its wait for a reader that does not read to one second.
   queue_.end();
   sink_->finish();
   if (thread_.joinable()) thread_.join();
@@ -118,7 +118,7 @@ void QueuedLogService::reportLosses() {
                        .category = "log",
                        .text = std::move(text),
                        .wholeLength = length};
-  // Write directly to the sink: the queue may be full again.
+  // Write directly to the sink, because the queue may be full again.
   sink_->write({&entry, 1});
 }
 

@@ -22,8 +22,8 @@ namespace halvox::platform::linux_ {
 // The log of the service. A bounded queue leads to one thread that formats and writes lines. A slow
 // reader of the log therefore never delays the threads that log. When the queue is full, lines are
 // dropped and counted; the last part of the queue is kept for errors. The log reports the loss when
-// there is room again. Lines can contain texts of clients: control characters are escaped, and long
-// lines are cut. The thread sleeps while nothing is logged.
+// the queue has space again. Lines can contain texts of clients: control characters are escaped,
+// and long lines are cut. The thread sleeps while nothing is logged.
 //
 // The newest lines also stay in memory, at a level of their own, for captures of diagnostics.
 //
@@ -40,7 +40,8 @@ class QueuedLogService final : public LogService {
     std::optional<LogLevel> kept;
   };
 
-  // Callers need not format lines below both levels. `statistics` must outlive the service.
+  // Categories report lines below both levels as unwanted, so that callers do not format them.
+  // `statistics` must outlive the service.
   QueuedLogService(Levels levels, std::unique_ptr<LogSink> sink, StatisticsService& statistics);
   // Writes to the journal if standard error is connected to it, otherwise to standard error.
   static std::unique_ptr<QueuedLogService> onStandardError(Levels levels,

@@ -5,8 +5,8 @@ namespace halvox::platform::linux_ {
 Counter& CounterStatisticsService::counter(std::string_view piece, std::string_view name) {
   const MutexLock lock(mutex_);
   CountersOfPiece& counters = counters_.try_emplace(std::string(piece)).first->second;
-  // A map, because its elements stay where they are: callers keep the counter for the life of the
-  // service.
+  // A map, because its elements never move and callers keep references to counters for the life of
+  // the service.
   return counters.try_emplace(std::string(name)).first->second;
 }
 

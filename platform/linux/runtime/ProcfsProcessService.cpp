@@ -16,7 +16,8 @@ constexpr std::size_t kLongestName = 15;
 // The name in a `comm` file: everything except the newline that the kernel appends. A name may
 // contain any character but NUL, including newlines and parentheses.
 std::optional<std::string> readCommandName(const std::string& path) {
-  // Names of kernel threads can be longer than those of processes.
+  // Read more than kLongestName bytes, because names of kernel threads can be longer than those of
+  // processes.
   const FileContent file =
       readWholeFile({.path = path.c_str(), .most = 128, .excess = FileToRead::Excess::kCut});
   if (file.bytes.empty()) return std::nullopt;

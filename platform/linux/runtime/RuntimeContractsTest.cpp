@@ -1,4 +1,4 @@
-// The contracts of the ports, run on the adapters of this folder.
+// The contracts of the platform services, run on the adapters of this folder.
 
 #include <array>
 #include <chrono>
@@ -28,7 +28,7 @@ namespace adapters {
 class LibcClockHarness {
  public:
   ClockService& service() { return service_; }
-  // The clock under test is the real one: only real time moves it.
+  // The clock under test is the real one, which only real time moves.
   void letPass(std::chrono::milliseconds time) { std::this_thread::sleep_for(time); }
 
  private:

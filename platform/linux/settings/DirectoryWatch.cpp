@@ -16,7 +16,7 @@ constexpr std::uint32_t kVanishing = IN_MOVED_FROM | IN_DELETE;
 // IN_CLOSE_WRITE and not IN_MODIFY: a save is one change, however many writes it makes. IN_ATTRIB
 // notices `touch`.
 constexpr std::uint32_t kChanging = IN_CLOSE_WRITE | IN_ATTRIB | kAppearing | kVanishing;
-// After one of these events the watches may be incomplete, and all are made again.
+// After one of these events, some watches may be missing. All of them are then made again.
 constexpr std::uint32_t kGone = kLeaving | IN_IGNORED | IN_UNMOUNT | IN_Q_OVERFLOW;
 
 bool isMissing(std::error_code error) {
@@ -53,8 +53,9 @@ std::error_code DirectoryWatch::arm(std::vector<std::filesystem::path> directori
   return first;
 }
 
-// The kernel has one watch for each directory and returns the same descriptor for all. IN_MASK_ADD
-// adds the events to those of an earlier call; without it they would be replaced.
+// The kernel has one watch for each directory and returns its descriptor again for a second call.
+// With IN_MASK_ADD, the call adds events to those of an earlier call. Without it, the call would
+// replace them.
 std::error_code DirectoryWatch::add(const std::filesystem::path& path, std::uint32_t events,
                                     Watch*& watch) {
   const int descriptor =
@@ -64,9 +65,9 @@ std::error_code DirectoryWatch::add(const std::filesystem::path& path, std::uint
   return {};
 }
 
-// Watches every directory from the root to the wanted one. Watches the last one for changes of its
-// files, the others only for being moved or deleted. Where the path ends, waits for the next
-// directory to appear.
+// Watches every directory from the root to the wanted one: the last one for changes of its files,
+// the others only for being moved or deleted. If a directory is missing, watches its parent until
+// it appears.
 std::error_code DirectoryWatch::watchWay(std::size_t directory) {
   const std::filesystem::path& target = directories_[directory];
   std::filesystem::path path;
@@ -76,13 +77,12 @@ std::error_code DirectoryWatch::watchWay(std::size_t directory) {
     const bool isTarget = path == target;
     Watch* watch = nullptr;
     std::error_code error = add(path, isTarget ? kChanging | kLeaving : kLeaving, watch);
-    // A path that ends early is watched where it ends, so that the missing directory is noticed
-    // when it appears.
+    // If a directory is missing, watch its parent, so that its appearance is noticed.
     if (isMissing(error) && !parent.empty()) {
       Watch* last = nullptr;
       if (const auto refused = add(parent, kAppearing, last)) return refused;
       last->awaited.insert(part.native());
-      // Try again: it may have appeared before the parent was watched.
+      // Try again, because the directory may have appeared before the parent was watched.
       error = add(path, isTarget ? kChanging | kLeaving : kLeaving, watch);
       if (isMissing(error)) return {};
     }

@@ -22,11 +22,12 @@ namespace {
 
 using namespace std::chrono_literals;
 
-// A change is posted after kQuietTime without another, but not later than kLongestDelay after the
-// first: steady changes must not delay a post for ever.
+// A change is posted when no other has followed for kQuietTime. It is posted at the latest
+// kLongestDelay after the first change, because steady changes must not delay a post for ever.
 constexpr auto kQuietTime = 50ms;
 constexpr auto kLongestDelay = 300ms;
-// Used only while watching fails, so that it causes no wake-ups otherwise.
+// The interval between attempts to watch. Used only while watching fails, so that the thread does
+// not wake up otherwise.
 constexpr auto kRetryTime = 5s;
 
 // The directories that are always watched, in order.
@@ -78,7 +79,7 @@ NotifyStatus InotifyNotifyService::notify_register_dispatch(std::string_view nam
 }
 
 bool InotifyNotifyService::ensureRunning() {
-  // The first registration starts the thread: a service without registrations needs none.
+  // The first registration starts the thread, because a service without registrations needs none.
   if (thread_.joinable()) return true;
   wake_.reset(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
   if (!wake_) return false;
@@ -140,7 +141,7 @@ bool InotifyNotifyService::adoptRegistrations() {
 
 void InotifyNotifyService::arm() {
   const bool wasFailing = retryAt_.has_value();
-  // Links first: their targets decide which directories are watched.
+  // Find the links first, because their targets decide which directories are watched.
   linked_ = settings_.linkedSettings();
   notifyLinks_ = linkedFiles(directories_[kNotifyDirectory]);
   std::vector<std::filesystem::path> directories = directories_;
@@ -165,7 +166,7 @@ void InotifyNotifyService::arm() {
   noteNews();
 }
 
-// Any change may have changed a link. Watches the new targets if links now lead elsewhere.
+// Watches other directories if links now lead elsewhere. Every change may have been one of a link.
 void InotifyNotifyService::followLinks() {
   if (!settings_.hasNews()) return;
   if (settings_.linkedSettings() != linked_ ||

@@ -296,7 +296,7 @@ TEST_F(InotifyNotifyServiceTest, AFileThatBecomesALinkIsFollowed) {
   EXPECT_EQ(postsOf([&] { write(scratch_ / "two", "a = 22"); }), 1);
 }
 
-// Settings that are replaced all at once are often kept in this way.
+// Settings that must all change at the same moment are often kept in this way.
 TEST_F(InotifyNotifyServiceTest, ALinkedDirectoryOnTheWayIsFollowed) {
   const auto directory = preferences() / "mobile";
   write(directory / "..1" / "org.example.toml", "a = 1");

@@ -38,7 +38,7 @@ std::vector<fs::path> linkedFiles(const fs::path& path) {
       rest.insert(rest.begin(), target.begin(), target.end());
     }
   }
-  // Add the target, too: a change of the target is a change of the file.
+  // Add the target, too, because a change of the target is a change of the file.
   if (!found.empty()) found.push_back(way);
   return found;
 }

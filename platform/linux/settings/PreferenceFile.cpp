@@ -14,12 +14,13 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The parser quotes the file in its error messages, and anyone may have written the file.
+// The reason is bounded, because the parser quotes the file in its error messages and anyone may
+// have written the file.
 constexpr std::size_t kLongestReason = 400;
 
 Failure<> problem(const std::filesystem::path& file, std::string_view what) {
   Failure<> error;
-  // Do not cut the path: the user needs all of it to find the file.
+  // Do not cut the path, because the user needs all of it to find the file.
   appendEscaped(error.message, file.native(), std::numeric_limits<std::size_t>::max());
   appendEscaped(error.message, what, kLongestReason);
   return error;

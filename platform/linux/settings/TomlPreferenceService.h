@@ -8,7 +8,8 @@ namespace halvox::platform::linux_ {
 
 // Preferences from TOML files, `<directory>/<user>/<domain>.toml`. Suites are domains of the user
 // "mobile". Keeps nothing between calls: each call reads and parses the file. A cache would have to
-// rely on time stamps, and two saves within one tick of the file system's clock have the same.
+// rely on time stamps, and two saves within one tick of the file system's clock have the same time
+// stamp.
 //
 // Owned by the platform. Any thread may call; blocks on the disk. A file that cannot be read counts
 // as absent; PreferenceReader logs why.

@@ -48,7 +48,7 @@ TEST_F(TomlPreferenceServiceTest, SuitesAreDomainsOfTheUserMobile) {
 
 TEST_F(TomlPreferenceServiceTest, EveryCallReadsAfresh) {
   for (int number = 0; number < 100; ++number) {
-    // Each file has the same size and, within one tick of the clock, the same time.
+    // All versions of the file have the same size and, within one tick of the clock, the same time.
     store("key = " + std::to_string(100 + number));
     ASSERT_EQ(at("key"), Value(100 + number));
   }

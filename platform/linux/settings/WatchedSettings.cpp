@@ -57,8 +57,8 @@ SettingBaseline WatchedSettings::look(const std::string& name) const {
 }
 
 void WatchedSettings::add(const std::string& name, SettingBaseline&& baseline) {
-  // Note each new entry as changed, so that it is compared once: it may have changed since the
-  // baseline was taken.
+  // Note each new entry as changed, so that it is compared once, because it may have changed since
+  // the baseline was taken.
   if (names_.known.emplace(name, NotifyFile{baseline.file}).second) names_.news.insert(name);
   for (auto& [domain, values] : baseline.domains) {
     if (domains_.known.emplace(domain, std::move(values)).second) domains_.news.insert(domain);
@@ -68,8 +68,8 @@ void WatchedSettings::add(const std::string& name, SettingBaseline&& baseline) {
 void WatchedSettings::noteNotifyFile(std::string_view file) {
   const auto known = names_.known.find(file);
   if (known == names_.known.end()) return;
-  // The event is enough: a file that is deleted again before its state is read also counts as a
-  // post.
+  // The event alone is a reason to post, because the file may be deleted again before its state is
+  // read.
   known->second.wasTouched = true;
   names_.news.insert(known->first);
 }
@@ -119,7 +119,7 @@ std::set<std::string> WatchedSettings::settle() {
 bool WatchedSettings::settleName(const std::string& name) {
   const NotifyFile before = std::exchange(names_.known[name], NotifyFile{mark(name)});
   const auto& now = names_.known[name].mark;
-  // A file that has only disappeared is not a post.
+  // A file that has disappeared does not post its name, unless it was touched before.
   const bool isNews = before.wasTouched || (now.has_value() && now != before.mark);
   if (!isNews) counters_.unchanged.add();
   return isNews;

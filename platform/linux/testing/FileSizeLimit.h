@@ -6,8 +6,8 @@
 
 namespace halvox::platform::linux_ {
 
-// While it exists, files of this process cannot grow beyond that many bytes, as on a full disk. One
-// at a time.
+// While it exists, files of this process cannot grow beyond that many bytes, as on a full disk.
+// Only one may exist at a time.
 class FileSizeLimit {
  public:
   explicit FileSizeLimit(rlim_t bytes) : oldAction_(std::signal(SIGXFSZ, SIG_IGN)) {

@@ -27,8 +27,8 @@ std::shared_ptr<NoSession> own(const KtraceService::Session& session, State stat
   return ours != nullptr && ours->state == state ? ours : nullptr;
 }
 
-// Kernel traces that cannot be started. They still follow the states of the port: an end completes
-// them, because the session's stop waits for the completion.
+// Kernel traces that cannot be started. They still follow the states of KtraceService: an end
+// completes them, because the stop of a reporting session waits for the completion.
 class NoKtraceService final : public KtraceService {
  public:
   Session ktrace_session_create() override { return std::make_shared<NoSession>(); }

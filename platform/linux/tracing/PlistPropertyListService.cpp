@@ -160,7 +160,8 @@ std::optional<Data> PlistPropertyListService::readFile(std::string_view path,
     case FileContent::Outcome::kNotRegular:
       return fail(S_ISDIR(content.mode) ? EISDIR : EINVAL);
     case FileContent::Outcome::kTooLarge:
-      // A file that was small enough when it was opened has grown since: it is being written.
+      // The file was small enough when it was opened and has grown since. A program is still
+      // writing it.
       return fail(content.size > kMostFileBytes ? EFBIG : EAGAIN);
     case FileContent::Outcome::kMissing:
     case FileContent::Outcome::kFailed:
@@ -180,8 +181,8 @@ std::optional<Value> PlistPropertyListService::parse(const std::optional<Data>& 
   if (span.empty()) return fail("is empty");
   if (span.size() > kMostFileBytes) return fail("is too large");
   const std::string_view text(reinterpret_cast<const char*>(span.data()), span.size());
-  // Check before the library sees a byte: the library recurses, copies shared objects, and ends the
-  // process by assertions.
+  // Check before the library sees a byte, because the library recurses, copies shared objects, and
+  // ends the process by assertions.
   if (const auto reason = whyUnreadable(text, kBounds)) return fail(*reason);
   List list;
   const auto length = static_cast<std::uint32_t>(text.size());
@@ -191,7 +192,7 @@ std::optional<Value> PlistPropertyListService::parse(const std::optional<Data>& 
     plist_from_xml(text.data(), length, list.out());
   }
   if (!list) return fail("cannot be parsed: it is neither valid XML nor valid binary");
-  // Check the result once more: the shape only estimates how the library reads the bytes.
+  // Check the result once more, because the shape only estimates how the library reads the bytes.
   bool isTooDeep = false;
   Value root = convert(list.get(), kBounds.depth, isTooDeep);
   if (isTooDeep) return fail("is nested too deeply");

@@ -55,7 +55,8 @@ class XmlShape {
  private:
   static constexpr Reason kMore = "";
 
-  // Moves past the next piece of markup. Null at the end, kMore if there is more to read.
+  // Moves past the next piece of markup. Returns kMore if there is more to read, null at the end of
+  // a valid text, and otherwise the reason to refuse it.
   Reason step() {
     const std::size_t start = text_.find('<');
     if (start == std::string_view::npos) return nullptr;
@@ -191,7 +192,7 @@ class BinaryShape {
     if (child >= objects_) return kNotBinary;
     switch (weights_[child].state) {
       case Weight::State::kNew:
-        // Check the depth before reading the child: otherwise a deeply nested list would make the
+        // Check the depth before reading the child. Otherwise a deeply nested list would make the
         // stack grow without limit.
         if (open_.size() > bounds_.depth) return kTooDeep;
         return push(child);  // and continues here when the child is done
@@ -206,7 +207,8 @@ class BinaryShape {
 
   Reason take(Weight& parent, const Weight& child) const {
     parent.depth = static_cast<std::uint8_t>(std::max<int>(parent.depth, child.depth + 1));
-    // Add them for each use of a shared object, because the library makes a copy for each use.
+    // Add the weight of a shared object for each of its uses, because the library makes a copy for
+    // each use.
     parent.elements += child.elements;
     parent.bytes += child.bytes;
     if (parent.depth > bounds_.depth) return kTooDeep;

@@ -15,8 +15,8 @@ struct PropertyListBounds {
   std::uint64_t bytes = 32U << 20U;  // of texts and data; a shared one counts for each use
 };
 
-// Why these bytes must not be given to libplist; none if they are within the bounds. They may still
-// not be a property list: the library finds that out.
+// Returns why these bytes must not be passed to libplist; none if they are within the bounds. Bytes
+// within the bounds may still not be a property list: the library finds that out.
 //
 // The check comes first because the library cannot be stopped. It recurses for each level until the
 // stack ends. It copies each value that a binary list uses twice, which can make any number of

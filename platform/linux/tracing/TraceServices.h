@@ -34,8 +34,8 @@ class TraceServices {
   virtual void stop() = 0;
   // Removes everything that this service made in the tracer. Call it after the queues have ended.
   virtual void close() = 0;
-  // Replaces close() if a queue does not end, for example because a stop waits for its trace. May
-  // wait for an operation of the tracer that is in progress.
+  // Call this instead of close() if a queue does not end, for example because a stop waits for its
+  // trace. May wait for an operation of the tracer that is in progress.
   virtual void abandon() = 0;
   // Names the tracer in log lines.
   [[nodiscard]] virtual std::string description() const = 0;
@@ -48,16 +48,16 @@ struct TraceOptions {
   Tracing tracing = Tracing::kDisabled;    // whether a session may be traced at all
 };
 
-// Returns services that record with LTTng. Loads halvox-tracing-lttng.so for them, which brings the
-// libraries of LTTng's control and of babeltrace2. Returns services whose traces cannot be started,
-// and whose description says why, when tracing is disabled or the module cannot be loaded. The
-// module is also loaded when an earlier service did not remove a recording, because only the module
-// can. The log and the statistics must outlive the services.
+// Returns services that record with LTTng. Loads halvox-tracing-lttng.so for them, and with it
+// LTTng's control library and babeltrace2. Returns services whose traces cannot be started, and
+// whose description says why, when tracing is disabled or the module cannot be loaded. The module
+// is also loaded when an earlier service did not remove a recording, because only the module can.
+// The log and the statistics must outlive the services.
 [[nodiscard]] std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options,
                                                                LogService& log,
                                                                StatisticsService& statistics);
 
-// Whether a service that ended in the middle of a trace left something in that directory.
+// True if a service that ended in the middle of a trace left something in that directory.
 [[nodiscard]] bool hasTraceLeftovers(const std::filesystem::path& tracesDirectory);
 
 // Names in the directory of traces: the directory of the traces being recorded, and the file that

@@ -10,7 +10,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The process is polled, because it is not our child and we cannot wait for it.
+// The polling interval. The process is not a child of this one, which can therefore not wait for
+// it.
 constexpr std::chrono::milliseconds kLookEvery{10};
 
 // Empty if there is no such process, or if it has ended and its parent has not waited for it.
@@ -36,7 +37,7 @@ std::optional<DaemonProcess> DaemonProcess::read(const std::filesystem::path& no
 bool DaemonProcess::write(const std::filesystem::path& noteFile) const {
   std::ofstream file(noteFile);
   file << pid << ' ' << startTime << '\n';
-  // Close the file before the check: the bytes reach it only now.
+  // Close the file before the check, because the bytes may reach it only then.
   file.close();
   return !file.fail();
 }

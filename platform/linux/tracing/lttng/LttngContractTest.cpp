@@ -124,7 +124,7 @@ class LttngHarness {
   }
 
   bool letRunUntil(const std::function<bool()>& condition) { return linux_::eventually(condition); }
-  // The files of a recording exist until it has been read back, packed or given up.
+  // The files of a recording exist until it has been read back, packed or discarded.
   std::size_t recordings() {
     std::error_code ignored;
     const auto found = fs::directory_iterator(traces_ / "scratch", ignored);

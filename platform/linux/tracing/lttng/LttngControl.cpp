@@ -24,8 +24,8 @@ using Channel = UniqueHandle<lttng_channel*, lttng_channel_destroy>;
 using Event = UniqueHandle<lttng_event*, lttng_event_destroy>;
 
 constexpr const char* kChannel = "halvox";
-// The buffers of one processor. 16 MiB hold the events of one second at a rate of 200,000 a second:
-// the consumer may be that late.
+// The buffers of one processor. 16 MiB hold the events of one second at a rate of 200,000 a second.
+// The consumer may therefore be a second late.
 constexpr std::uint64_t kSubBufferBytes = 1U << 20U;
 constexpr std::uint64_t kMostSubBuffers = 16;
 constexpr std::uint64_t kFewestSubBuffers = 4;
@@ -42,7 +42,7 @@ std::uint64_t subBuffers() {
 lttng_domain domain() {
   lttng_domain result{};
   result.type = LTTNG_DOMAIN_UST;
-  // One set of buffers for each user, not for each process: processes come and go.
+  // One set of buffers for each user, not for each process, because processes come and go.
   result.buf_type = LTTNG_BUFFER_PER_UID;
   return result;
 }
@@ -116,10 +116,11 @@ void LttngControl::removeLeftovers() {
   const MutexLock lock(mutex_);
   std::error_code ignored;
   const bool isRecorded = std::filesystem::exists(scratchDirectory_, ignored);
-  // A call of the tracer's library connects to a daemon, which may hang. Most starts do not need
-  // it.
+  // Do not call the tracer's library if nothing was left, as at most starts: a call connects to a
+  // daemon, which may hang.
   if (!isRecorded && !daemon_.isNoted()) return;
-  // Adopt the daemon before destroying the sessions: if it is ours, it must have a keeper again.
+  // Adopt the daemon before destroying the sessions: if an earlier run of this service started it,
+  // it needs a keeper again.
   daemon_.adopt(namePrefix());
   if (::lttng_session_daemon_alive() == 1) destroyTracerSessions(namePrefix());
   std::filesystem::remove_all(recordingDirectory_, ignored);
@@ -138,8 +139,7 @@ Result<LttngControl::Recording> LttngControl::begin(const RecordingPlan& plan) {
     discard(recording);
     return std::move(isSetUp).error();
   }
-  // For tests and tools that wait for it. Errors are ignored, because the recording works without
-  // it.
+  // Tests and tools wait for this file. Errors are ignored, because the recording works without it.
   std::filesystem::create_directories(recordingDirectory_, ignored);
   std::ofstream(recordingDirectory_ / recording.name).close();
   return recording;
@@ -174,7 +174,7 @@ Result<void> LttngControl::setUp(const RecordingPlan& plan, const Recording& rec
 Result<void> LttngControl::end(const Recording& recording) {
   const MutexLock lock(mutex_);
   std::error_code ignored;
-  // Remove the file first: its presence promises that events are recorded.
+  // Remove the file first, because its presence promises that events are recorded.
   std::filesystem::remove(recordingDirectory_ / recording.name, ignored);
   const char* const name = recording.name.c_str();
   // Both calls wait until the recording is on the disk. Make both, even if the first one fails.

@@ -50,7 +50,8 @@ class LttngControl {
   LttngControl(const LttngControl&) = delete;
   LttngControl& operator=(const LttngControl&) = delete;
 
-  // Destroys what an earlier service left, and takes over its daemon. Cheap if nothing was left.
+  // Destroys what an earlier service left, and takes over its daemon. Does not call the tracer if
+  // nothing was left.
   void removeLeftovers();
   // Begins to record. Starts a session daemon if none answers, which takes up to ten seconds. On
   // failure deletes the recording's files.

@@ -98,8 +98,8 @@ std::shared_ptr<LttngKtraceSession> own(const KtraceService::Session& session, S
 
 bool DeliveryGate::enter() {
   const MutexLock lock(mutex_);
-  // Without this wait, all events of a trace that is read faster than it is analysed would be in
-  // memory.
+  // Without this wait, a trace that is read faster than it is analysed would be in memory as a
+  // whole.
   while (inside_ == most_ && !isStopping_) changed_.wait(mutex_);
   if (isStopping_) return false;
   ++inside_;
@@ -195,7 +195,7 @@ void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& sessi
     if (!ended || !isRead) failed_.add();
     control_.discard(*session->recording);
   }
-  // Added after all batches, on the same queue: the completion comes after the last event.
+  // Add the completion to the same queue after all batches, so that it comes after the last event.
   session->queue->async(JobWeight::kMayBlock, [session] {
     // Move the handler out first: it may destroy the session, which would destroy the handler.
     if (const auto completion = std::exchange(session->completion, nullptr)) completion();
@@ -217,8 +217,8 @@ bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
     return true;
   };
   const auto take = [&](trace_point point) {
-    // The reader gives each point a wall time. The port promises 0 to sessions that did not enable
-    // wall times.
+    // The reader sets a wall time in each point. KtraceService promises 0 to sessions that did not
+    // enable wall times.
     if (!session->hasWalltimes) point.walltime = 0;
     batch->add(point);
     return batch->size() < kBatchEvents || deliver();
@@ -235,8 +235,8 @@ bool LttngKtraceService::deliverAll(const std::shared_ptr<LttngKtraceSession>& s
                "; its remaining events are lost");
   }
   if (reading.lost + reading.lostPackets > 0) {
-    log_.error("the tracer's buffers had no room for ", reading.lost, " events and ",
-               reading.lostPackets, " packets of a kernel trace; they are lost");
+    log_.error("the tracer's buffers were full; lost ", reading.lost, " events and ",
+               reading.lostPackets, " packets of a kernel trace");
   }
   return !reading.failure.has_value();
 }

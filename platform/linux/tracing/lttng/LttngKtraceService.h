@@ -20,7 +20,7 @@ class LttngKtraceSession;
 class DeliveryGate {
  public:
   explicit DeliveryGate(unsigned most) : most_(most) {}
-  // Waits for room. Returns false if the service stops.
+  // Waits until another batch may be delivered. Returns false if the service stops.
   [[nodiscard]] bool enter();
   void leave();
   void stop();
@@ -45,8 +45,8 @@ class DeliveryGate {
 // Threads: a start waits for the session daemon on the caller's thread, and starts one if there is
 // none. An end returns at once; a thread of the service then stops the recording, reads it back in
 // the order of time, and delivers the events in batches. The composition root owns the service.
-// Failure: logged once and counted, and the session still completes. Events that the tracer had no
-// room for are counted and logged once a trace. No file of a trace remains.
+// Failure: logged once and counted, and the session still completes. Events that were lost because
+// the tracer's buffers were full are counted, and logged once a trace. No file of a trace remains.
 class LttngKtraceService final : public KtraceService {
  public:
   // All three must outlive the service.

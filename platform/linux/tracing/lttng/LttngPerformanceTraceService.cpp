@@ -105,7 +105,7 @@ namespace {
 
 using Work = LttngPerformanceTraceService::Work;
 
-// One performance trace. See the port for its states; only the queue touches the recording.
+// One performance trace. KQTraceSession describes its states. Only the queue uses the recording.
 class LttngTraceSession final : public KQTraceSession,
                                 public std::enable_shared_from_this<LttngTraceSession> {
  public:
@@ -153,7 +153,8 @@ class LttngTraceSession final : public KQTraceSession,
     const LttngControl::Recording recording = *std::exchange(recording_, std::nullopt);
     auto error = work_->end(recording);
     if (const auto listener = delegate()) listener->kqTraceDidStop(error);
-    // Saved even if the end failed: what was recorded until then may still be of use.
+    // Save the trace even if its end failed, because what was recorded until then may still be of
+    // use.
     std::string url;
     const auto saveError = work_->save(recording, url);
     work_->control.discard(recording);

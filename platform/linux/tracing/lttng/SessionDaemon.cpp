@@ -20,8 +20,8 @@ bool SessionDaemon::isNoted() const {
 }
 
 void SessionDaemon::adopt(const std::string& ownSessions) {
-  // The keeper of the last run may be ending its daemon now. An adopted daemon would then end a
-  // moment later.
+  // Wait for the keeper of the last run, which may be ending its daemon now. If that daemon were
+  // adopted, it would end a moment later.
   TracerKeeper::awaitEarlier(noteFile_, keeperEndsWithin());
   ownSessions_ = ownSessions;
   auto noted = DaemonProcess::read(noteFile_);
@@ -34,7 +34,7 @@ void SessionDaemon::adopt(const std::string& ownSessions) {
 }
 
 Result<void> SessionDaemon::start(const std::string& ownSessions) {
-  // A daemon of ours that runs but does not answer would keep a new one from starting.
+  // End our daemon first: if it runs but does not answer, it prevents a new one from starting.
   end();
   ownSessions_ = ownSessions;
   auto started = keeper_.start({noteFile_, ownSessions_});

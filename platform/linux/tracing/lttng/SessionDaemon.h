@@ -17,8 +17,8 @@ namespace halvox::platform::linux_ {
 //   not ours --start() or adopt()--> ours --end() or leave()--> not ours
 //
 // The daemon must not outlive the service, however the service ends, unless others use it. Its
-// keeper (TracerKeeper) ensures that. A file names the process: a later service then recognises a
-// daemon that stayed because others used it. A process is signalled only if its start time is the
+// keeper (TracerKeeper) ensures that. A file names the process, so that a later service recognises
+// a daemon that stayed because others used it. A process is signalled only if its start time is the
 // one in the file.
 class SessionDaemon {
  public:
@@ -44,8 +44,8 @@ class SessionDaemon {
   [[nodiscard]] bool isOurs() const { return process_.has_value(); }
   // Ends the daemon if it is ours, and waits until it has ended.
   void end();
-  // Lets the keeper destroy our sessions and, unless others use the daemon, end it. Waits until
-  // that is done. Afterwards the daemon is not ours.
+  // Lets the keeper destroy our sessions and end the daemon, unless others use the daemon. Waits
+  // until that is done. Afterwards the daemon is not ours.
   void leave();
 
  private:

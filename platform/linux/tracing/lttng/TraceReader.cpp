@@ -82,8 +82,8 @@ class Sink {
     if (status != BT_MESSAGE_ITERATOR_NEXT_STATUS_OK) return static_cast<Status>(status);
     auto& self = *static_cast<Sink*>(sink);
     for (std::uint64_t index = 0; index < count; ++index) {
-      // The remaining messages of the array are released unread: each has a reference that must be
-      // put.
+      // Release the remaining messages of the array unread, because each of them is a reference
+      // that must be released.
       if (self.wantsMore_) self.take(messages[index]);
       bt_message_put_ref(messages[index]);
     }
@@ -283,7 +283,7 @@ std::uint64_t TraceClock::toNanoseconds(std::uint64_t ticks) const {
 TraceReading readTraces(const std::filesystem::path& directory, const TraceListener& listener) {
   TraceReading reading;
   const auto directories = traceDirectories(directory);
-  // Nothing was emitted while the trace ran, which is not a failure.
+  // No event was emitted while the trace ran, which is not a failure.
   if (directories.empty()) return reading;
   Sink sink(listener, reading);
   TraceGraph graph;

@@ -23,7 +23,7 @@ struct TraceClock {
 // The result of reading a trace.
 struct TraceReading {
   std::uint64_t events = 0;
-  std::uint64_t lost = 0;         // events that the tracer's buffers had no room for
+  std::uint64_t lost = 0;         // events for which the tracer's buffers were full
   std::uint64_t lostPackets = 0;  // each with an unknown number of events
   std::optional<std::string> failure{};
 };

@@ -44,8 +44,8 @@ constexpr std::chrono::seconds kEndsWithin{5};  // after SIGTERM; then it is kil
 volatile std::sig_atomic_t silentDaemon = 0;  // the daemon whose answer is awaited; 0: none
 
 // The library waits for a daemon without limit. A daemon that hangs is of no use to other programs
-// either. It is killed, which also ends the wait. If the wait continues, it is for another daemon:
-// the second alarm then ends the keeper.
+// either. It is killed, which also ends the wait. If the library then still waits, it waits for
+// another daemon, and the second alarm ends the keeper.
 void onSilence(int /*signal*/) {
   const pid_t daemon = silentDaemon;
   if (daemon == 0) ::_exit(EXIT_FAILURE);
@@ -95,7 +95,7 @@ bool isUsedByOthers(const DaemonProcess& daemon, std::string_view ownSessions) {
 
 int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
          const std::optional<DaemonProcess>& named) {
-  // The keeper alone holds the lock: the descriptor is not inherited by the daemon.
+  // Only the keeper holds the lock, because the daemon does not inherit the descriptor.
   const UniqueFd note(::open(noteFile.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644));
   if (!note || ::flock(note.get(), LOCK_EX) != 0) {
     say("cannot lock " + noteFile.string() + ": " + errnoText(errno));
@@ -115,7 +115,7 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
   // the daemon.
   say(std::to_string(daemon->pid) + " " + daemon->startTime);
   awaitEndOfService();
-  // The note stays: the next service finds the daemon through it and gives the daemon a keeper.
+  // Keep the note, through which the next service finds the daemon and gives it a keeper.
   if (daemon->isAlive() && isUsedByOthers(*daemon, ownSessions)) return EXIT_SUCCESS;
   daemon->end(kEndsWithin);
   std::filesystem::remove(noteFile, ignored);
