@@ -21,7 +21,7 @@ using AnalyticsPayloadBuilder = std::function<Dictionary()>;
 // every event is collected.
 //
 // Any thread may call. The composition root owns the service. A failure of storage is not reported
-// to the caller: the service counts the events that it drops, and logs them.
+// to the caller. The service counts the events that it drops, and logs them.
 class AnalyticsService {
  public:
   virtual ~AnalyticsService() = default;

@@ -55,9 +55,9 @@ class ExportedObject {
 };
 
 // Stands for one request that has not been carried out. The job that carries the request out holds
-// it; when the last copy is destroyed, the request counts as carried out, whether it was answered
-// or not. The connection reads from its client only while few of its tokens exist, which limits the
-// work that a client can have pending.
+// a copy. When the last copy is destroyed, the request counts as carried out, whether it was
+// answered or not. The connection reads from its client only while few of its tokens exist, which
+// limits the work that a client can have pending.
 using RequestToken = std::shared_ptr<void>;
 
 // What a request has besides its arguments.
@@ -95,7 +95,7 @@ class RequestSource {
   virtual void carriedOut(const RequestMark& mark) = 0;
 };
 
-// A ReplyCallback and a RequestToken in one, which needs no allocation. For the most frequent
+// A ReplyCallback and a RequestToken in one, which needs no allocation. Used for the most frequent
 // requests. The request counts as open as long as this object exists. Belongs to one thread at a
 // time.
 class PostedRequest {
@@ -135,7 +135,7 @@ enum class MethodEffect : std::uint8_t { kMayHoldMore, kHoldsNoMore, kMakesSessi
 // Who may make a request: anyone who can connect, or only the owner, which is root or the user that
 // the service runs as. The connection decides by the credentials that the kernel or the bus reports
 // for the other end, never by what a message says. It answers a request that is not allowed with
-// org.freedesktop.DBus.Error.AccessDenied; the object never sees it.
+// org.freedesktop.DBus.Error.AccessDenied. The object never sees that request.
 enum class MethodAccess : std::uint8_t { kAnybody, kOwner };
 
 // One method of an interface. `in` and `out` are D-Bus signatures. `invoke` hands a request to the

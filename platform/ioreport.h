@@ -154,11 +154,11 @@ class IOReportSamples {
 };
 
 // One moment at which several subscriptions are sampled. All samples of a moment come from the same
-// reading of the counters. A report samples eight groups: with a reading for each group, a report
+// reading of the counters. A report samples eight groups. With a reading for each group, a report
 // took 0.98 ms at the median (docs/decisions/0008).
 //
-// Its maker owns it and uses it on one thread at a time. Samples may outlive it. It must not
-// outlive the service.
+// The caller of makeMoment() owns it and uses it on one thread at a time. Samples may outlive their
+// moment. A moment must not outlive the service.
 class IOReportMoment {
  public:
   IOReportMoment() = default;
@@ -197,7 +197,7 @@ class IOReportService {
   virtual Subscription IOReportCreateSubscription(const Channels& channels,
                                                   Channels& subscribedChannels,
                                                   std::optional<IOReportError>& error) = 0;
-  // Makes a moment; never null. Does not read the counters: the first call of
+  // Makes a moment; never null. Does not read the counters. The first call of
   // IOReportCreateSamples() for the moment reads them.
   [[nodiscard]] virtual Moment makeMoment() = 0;
   // The current values of the channels in the set. A channel that appears after the set was made is

@@ -8,7 +8,7 @@ namespace halvox::platform {
 
 // Collects structured metrics in their protocol-buffers form.
 //
-// Any thread may call. A failure of storage is not reported to the caller: the service counts what
+// Any thread may call. A failure of storage is not reported to the caller. The service counts what
 // it drops, and logs it. The composition root owns the service.
 class MetricService {
  public:

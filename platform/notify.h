@@ -13,7 +13,7 @@ namespace halvox::platform {
 using NotifyStatus = std::uint32_t;
 using NotifyToken = std::int32_t;
 
-// Notifications by name: a program posts a name, and every handler registered for that name is
+// Notifications by name. A program posts a name, and every handler registered for that name is
 // called. A post carries no data; the receiver reads the new state itself.
 //
 // Any thread may call. The composition root owns the service.

@@ -17,7 +17,7 @@ namespace halvox::platform {
 // copy.
 class ObjectLog {
  public:
-  // `unit` is not copied: pass a constant.
+  // `unit` is not copied. Pass a constant.
   ObjectLog(LogCategory& category, std::string_view unit) : category_(&category), unit_(unit) {}
 
   template <typename... Parts>

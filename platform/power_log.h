@@ -10,7 +10,7 @@ namespace halvox::platform {
 
 // Collects registered power events.
 //
-// Any thread may call. A failure of storage is not reported to the caller: the service counts what
+// Any thread may call. A failure of storage is not reported to the caller. The service counts what
 // it drops, and logs it. The composition root owns the service.
 class PowerLogService {
  public:

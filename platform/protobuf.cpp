@@ -39,7 +39,8 @@ void appendEscaped(std::string& text, char character) {
     text += character;
     return;
   }
-  // Always write three octal digits: a digit that follows must not be read as part of the escape.
+  // Always write three octal digits, because a digit that follows must not be read as part of the
+  // escape.
   text += '\\';
   for (const unsigned shift : {6U, 3U, 0U}) {
     text += static_cast<char>('0' + ((static_cast<unsigned>(byte) >> shift) & 7U));
@@ -70,7 +71,7 @@ std::uint64_t ProtoReader::readVarint() {
 }
 
 ProtoReader::Tag ProtoReader::readTag() {
-  // The field number is not checked: an unknown field is skipped whatever its number.
+  // The field number is not checked, because an unknown field is skipped whatever its number.
   const std::uint64_t tag = readVarint();
   return {tag >> kWireTypeBits, static_cast<ProtoWireType>(tag & 7U)};
 }
@@ -78,7 +79,7 @@ ProtoReader::Tag ProtoReader::readTag() {
 void ProtoReader::readString(std::string& value) {
   const std::uint64_t length = readVarint();
   if (error_) return;
-  // Compare before adding: `position_ + length` could overflow.
+  // Compare before adding, because `position_ + length` could overflow.
   if (length > bytes_.size() - position_) {
     error_ = true;
     return;

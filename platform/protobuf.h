@@ -40,7 +40,8 @@ enum class ProtoWireType : std::uint8_t {
   kFixed32 = 5,
 };
 
-// A cursor over encoded bytes. It does not own them; they must outlive it. Used by one thread.
+// A cursor over encoded bytes. The caller owns the bytes, which must outlive the reader. Used by
+// one thread.
 //
 // The bytes are not trusted. Reading past the end sets the error flag, which stays set; nothing
 // beyond the bytes is ever read.
@@ -90,7 +91,7 @@ class ProtoReader {
 class ProtoWriter {
  public:
   void writeUInt64(std::uint64_t value, std::uint32_t number);
-  // A negative value takes ten bytes: the format extends it to 64 bits.
+  // A negative value takes ten bytes, because the format extends it to 64 bits.
   void writeInt32(std::int32_t value, std::uint32_t number);
   void writeString(std::string_view value, std::uint32_t number);
 

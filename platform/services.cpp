@@ -16,7 +16,7 @@ std::optional<Services>& slot() {
 
 const Services& installed() {
   if (!slot().has_value()) {
-    // The message cannot be logged: the log is one of the services that are missing.
+    // The message cannot be logged, because the log is one of the services that are missing.
     std::fputs("halvox: a platform service was used before the services were installed\n", stderr);
     std::abort();
   }

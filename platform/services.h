@@ -62,7 +62,7 @@ struct Services {
 void installServices(const Services& services);
 
 // The installed services. Any thread may call them after installServices(). An earlier call is a
-// bug in the program: it prints a line and aborts the process.
+// bug in the program. It prints a line and aborts the process.
 AnalyticsService& analytics();
 ClockService& clock();
 ConnectionService& connections();

@@ -12,7 +12,8 @@
 
 namespace halvox::platform {
 
-// Keys of the session info. Their texts are part of the interface: a back-end writes them out.
+// Keys of the session info. Their texts are part of the interface, because a back-end writes them
+// out.
 inline constexpr std::string_view kTLMReportingSessionInfoClientType =
     "TLMReportingSessionInfoClientType";
 inline constexpr std::string_view kTLMReportingSessionInfoClientVersion =
@@ -69,7 +70,7 @@ struct TLMReportingMessage {
 
 // The real-time reporting framework: forwards messages to the servers that collect them.
 //
-// Any thread may call; one session is used by one thread at a time. No call waits for a server: a
+// Any thread may call; one session is used by one thread at a time. No call waits for a server. A
 // call that takes time reports its end to a callback, which must not block either. The composition
 // root owns the service. The spelling of the functions is part of the interface.
 class TLMReportingService {

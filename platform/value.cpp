@@ -38,8 +38,8 @@ bool equalIntegers(std::int64_t left, bool leftSigned, std::int64_t right, bool 
   return leftSigned == rightSigned || left >= 0;
 }
 
-// Converts the double to the integer's type, never the reverse: an integer above 2^53 loses bits as
-// a double and would equal its neighbours.
+// Converts the double to the integer's type, never the reverse, because an integer above 2^53 loses
+// bits as a double and would equal its neighbours.
 bool equalsDouble(std::int64_t bits, bool isSigned, double number) {
   if (isSigned) {
     return number >= -kTwoTo63 && number < kTwoTo63 && number == std::trunc(number) &&
@@ -120,8 +120,8 @@ Value::Value(Dictionary dictionary) noexcept {
   setPayload(dictionary.rep_.take());
 }
 
-// The kind of node does not matter here: every counted node begins with its reference count. An
-// empty container has no node.
+// The kind of node does not matter here, because every counted node begins with its reference
+// count. An empty container has no node.
 void Value::retain() const noexcept {
   if (auto* references = payload<detail::ReferenceCount*>()) detail::retain(*references);
 }

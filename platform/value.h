@@ -28,8 +28,8 @@ struct Date {
 // that very constant, even if the text came from another process. The service tests some values by
 // identity; a client selects one by sending its text.
 //
-// Make constants only with static storage and before the first thread starts: the table of
-// constants has no lock. Each has at most 64 bytes and a text of its own.
+// Make constants only with static storage and before the first thread starts, because the table of
+// constants has no lock. Each constant has at most 64 bytes, and no two have the same text.
 class StringConstant {
  public:
   explicit StringConstant(std::string_view text);
@@ -402,7 +402,7 @@ class Dictionary {
   std::uint32_t count_ = 0;  // meaningless without a node
 };
 
-// A message as the components pass it on. It may be absent: a client can send none.
+// A message as the components pass it on. It may be absent, because a client can send none.
 using Message = std::optional<Dictionary>;
 
 // The text of a value as log lines show it: strings as they are, numbers in their shortest decimal

@@ -36,8 +36,8 @@ std::string describeNumber(const Value& value) {
   return {};
 }
 
-// Dates outside these years are mistakes, and the calendar of std::chrono ends at 32767. They are
-// printed as seconds.
+// Dates outside these years are printed as seconds, because they are mistakes and because the
+// calendar of std::chrono ends with the year 32767.
 constexpr double kEarliest = -62135596800.0;  // 0001-01-01
 constexpr double kLatest = 253402300799.0;    // 9999-12-31
 

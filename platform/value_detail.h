@@ -3,8 +3,8 @@
 // The shared nodes that values refer to. Only the sources of value.h include this header.
 //
 // Each node begins with its reference count, and its content follows the struct in the same block
-// of memory: one allocation for each node, and one cache miss less than with a pointer to the
-// content.
+// of memory. A node then needs one allocation, and reading it costs one cache miss less than with a
+// pointer to the content.
 
 #include <atomic>
 #include <cstdint>
@@ -79,8 +79,8 @@ struct ArrayRep {
 struct DictionaryRep {
   ReferenceCount references;
   // The number of entries that exist. Relaxed, because it only decides which dictionary may add the
-  // next entry. It need not publish the entries: a thread that reads an entry has received the
-  // dictionary from the thread that added the entry.
+  // next entry. It need not publish the entries, because a thread that reads an entry has received
+  // the dictionary from the thread that added the entry.
   std::atomic<std::uint32_t> used;
   std::uint32_t capacity;
   std::uint32_t indexSize;  // a power of two; 0 while the dictionary is small

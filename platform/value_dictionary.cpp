@@ -24,7 +24,7 @@ Reference allocateRep(std::size_t capacity) {
 
 void addToIndex(DictionaryRep& rep, std::uint32_t entry) {
   const std::uint32_t mask = rep.indexSize - 1;
-  // Do not use the key's own hash: a client can choose keys that collide in it.
+  // Do not use the key's own hash, because a client can choose keys that collide in it.
   std::uint32_t slot = detail::secretHash(rep.entries()[entry].key.text()) & mask;
   while (rep.index[slot] != 0) slot = (slot + 1) & mask;
   rep.index[slot] = entry + 1;
@@ -89,8 +89,8 @@ Dictionary::Entry* findEntry(const Reference& rep, std::size_t count, const Key&
   const auto matches = [&key](const Dictionary::Entry& entry) { return entry.key == key; };
   if (rep->indexSize != 0) return findIndexedEntry(rep, key.text(), matches);
   if (!key.isInterned()) return findEntry(rep, count, matches);
-  // Compare nodes without reading texts: each message is searched for several keys, and has almost
-  // none of them.
+  // Compare nodes without reading texts, because each message is searched for several keys, and has
+  // almost none of them.
   return findEntry(rep, count,
                    [&key](const Dictionary::Entry& entry) { return entry.key.sharesNode(key); });
 }
@@ -244,7 +244,7 @@ std::size_t Dictionary::memorySize() const {
 bool operator==(const Dictionary& left, const Dictionary& right) {
   if (left.size() != right.size()) return false;
   if (left.rep_ == right.rep_) return true;
-  // Try the same position first: repeated messages have their keys in the same order.
+  // Try the same position first, because repeated messages have their keys in the same order.
   const Dictionary::Entry* other = right.begin();
   for (const Dictionary::Entry& entry : left) {
     const Value* counterpart = other->key == entry.key ? &other->value : right.find(entry.key);

@@ -49,7 +49,7 @@ class InternTable {
   Probe probe(std::string_view text, std::uint32_t hash) {
     for (std::size_t step = 0; step < kMaxProbes; ++step) {
       auto& slot = slots_[(hash + step) % kTableSlots];
-      // Pairs with the release in insert(): a node seen here is complete.
+      // Pairs with the release in insert(), so that a node that is seen here is complete.
       KeyNode* node = slot.load(std::memory_order_acquire);
       if (node == nullptr) return {nullptr, &slot};
       if (node->hash == hash && node->view() == text) return {node, nullptr};
@@ -74,7 +74,7 @@ class InternTable {
 };
 
 InternTable& internTable() {
-  // Never destroyed: keys with static storage live longer than any static of this file.
+  // Never destroyed, because keys with static storage live longer than any static of this file.
   static auto* table = new InternTable;
   return *table;
 }
@@ -111,8 +111,8 @@ std::size_t Key::memorySize() const {
 }
 
 // Call only for different nodes. If one of the nodes is interned, their texts differ, because all
-// keys with its text share it. A text that was not interned once is never interned later: a table
-// that was full stays full, and slots that were occupied stay occupied.
+// keys with its text share it. A text that the table has once refused is never interned later,
+// because a full table stays full and occupied slots stay occupied.
 bool Key::equalNodes(KeyNode& left, KeyNode& right) {
   if (left.interned || right.interned) return false;
   return left.hash == right.hash && left.view() == right.view();

@@ -64,7 +64,8 @@ class FakeDispatchSemaphore final : public DispatchSemaphore {
 
   void signal() override;
   // Runs jobs until there is a signal, except those of the queue whose job waits. Throws
-  // std::logic_error if no job signals: a real thread would wait for ever. A job may call it.
+  // std::logic_error if no job signals, because a real thread would wait for ever. A job may call
+  // it.
   void wait() override;
 
  private:
@@ -94,9 +95,9 @@ class FakeDispatchService final : public DispatchService {
   void runUntilIdle();
   // Runs the oldest job that may run. Returns false if there is none.
   bool runOne();
-  // Lets time pass. First runs all pending jobs. Then runs each delayed job, and ends each wait, at
-  // its time, and after each of them the jobs that it adds. At equal times, delayed jobs run first.
-  // While a job runs, the clock shows its time.
+  // Lets time pass. First runs all pending jobs. Then runs each delayed job at its time and ends
+  // each wait at its time. After each of these steps, runs the jobs that were added. At equal
+  // times, delayed jobs run first. While a job runs, the clock shows its time.
   void advance(std::chrono::nanoseconds by);
   // Drops all jobs that have not run, and ends all waits without calling anything. If the
   // destructor of a job adds a job, that job is dropped, too.

@@ -163,7 +163,8 @@ void FakeKtraceService::ktrace_end(const Session& session, int reason) {
       if (!own->hasWalltimes) event.walltime = 0;
       own->deliver(event);
     }
-    // Move the handler out first: it may destroy the session, which would destroy the handler.
+    // Move the handler out first, because it may destroy the session, which would destroy the
+    // handler.
     if (const auto completion = std::exchange(own->completion, nullptr)) completion();
   });
 }

@@ -28,7 +28,7 @@ class FakeKtraceService final : public KtraceService {
   // Sets events that each session delivers before those that it has recorded, if they are in its
   // ranges.
   void setEvents(std::vector<trace_point> events);
-  // Emits an event: the sessions that record now keep it if it is in their ranges.
+  // Emits an event. The sessions that record now keep it if it is in their ranges.
   void emit(const trace_point& event);
   void setNanosecondsPerTick(std::uint64_t nanoseconds) { setTimebase(nanoseconds, 1); }
   // Sets how many nanoseconds that many ticks take. A conversion discards fractions of a

@@ -33,7 +33,7 @@ struct Registry {
 };
 
 Registry& registry() {
-  // Never destroyed: objects with static storage may still log.
+  // Never destroyed, because objects with static storage may still log.
   static auto* instance = new Registry;
   return *instance;
 }

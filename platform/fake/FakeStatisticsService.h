@@ -10,8 +10,8 @@
 
 namespace halvox::platform {
 
-// Counters that a test can read. The fake owns them: objects that count must be destroyed before
-// it. Any thread may call. FakePlatform owns it.
+// Counters that a test can read. The fake owns them. Objects that count must therefore be destroyed
+// before the fake. Any thread may call. FakePlatform owns it.
 class FakeStatisticsService final : public StatisticsService {
  public:
   // The count since this service was made or cleared; 0 for an unknown counter.
@@ -30,7 +30,7 @@ class FakeStatisticsService final : public StatisticsService {
   };
 
   mutable std::mutex mutex_;
-  // A map, because its elements do not move: references to counters stay valid.
+  // A map, because its elements do not move, and references to counters must stay valid.
   std::map<std::pair<std::string, std::string>, Count> counts_;
 };
 

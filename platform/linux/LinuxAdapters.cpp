@@ -14,8 +14,8 @@ ConnectionOptions connectionOptions(const Configuration& configuration) {
   ConnectionOptions options;
   options.socket = configuration.listener.socket;
   options.socketAccess = {configuration.listener.mode, configuration.listener.group};
-  // Make only the directory of the default socket: after a fresh login it may not exist. The
-  // administrator makes the directory of a configured path.
+  // Make only the directory of the default socket, because after a fresh login it may not exist.
+  // The administrator makes the directory of a configured path.
   options.makeSocketDirectory = configuration.listener.socket == defaultSocketPath();
   options.bus = configuration.listener.bus;
   options.starter = starterBus();
@@ -48,7 +48,7 @@ bool isTracingEnabled(FeatureFlagService& features) {
 }
 
 // If trace points are not available, the service runs without them and logs the reason at the
-// start. LTTng maps the buffers of every session that records into each process that has loaded it.
+// start. LTTng maps the buffers of every recording session into each process that has loaded LTTng.
 // The service therefore loads it only if the configuration asks for trace points.
 TracePoints makeTracePoints(const Configuration& configuration, FeatureFlagService& features) {
   if (!configuration.tracePoints && !isTracingEnabled(features)) {
@@ -84,8 +84,8 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
               dispatch.beginHelping();
             };
             options.endBatch = [this] { dispatch.endHelping(); };
-            // Wake the pool only after the replies: a client should not wait while other threads
-            // are woken.
+            // Wake the pool only after the replies were written, because a client should not wait
+            // while other threads are woken.
             options.afterReplies = [this] { dispatch.wakePool(); };
             options.onReportSignal = std::move(onReportSignal);
             return options;
@@ -95,7 +95,7 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
       tracePoints(makeTracePoints(configuration, featureFlags)),
       log(QueuedLogService::onStandardError({configuration.logLevel, configuration.logMemoryLevel},
                                             statistics)),
-      // Writes what is in the log's queue: its last line says why the process ends.
+      // Write the queued lines of the log, because the last one says why the process ends.
       process([this] { log->stop(); }),
       deviceProperties(configuration.device),
       store(storeOptions(configuration), {clock, statistics, backpressure}),

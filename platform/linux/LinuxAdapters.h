@@ -44,8 +44,8 @@ struct TracePoints {
 };
 
 // Every adapter of one process, in the order in which they need each other. Belongs to
-// LinuxPlatform, which opens and closes them. It has a header of its own because of its many
-// includes: only the two sources that compose the service include it.
+// LinuxPlatform, which opens and closes them. It has a header of its own, which only the two
+// sources that compose the service include, because the header has many includes.
 struct LinuxAdapters {
   // Starts the threads of the log and of the queues; nothing outside the process is touched yet.
   // `onReportSignal` runs on the main thread for each SIGUSR1.
@@ -56,8 +56,8 @@ struct LinuxAdapters {
   // The adapter of the back-end that the configuration names.
   [[nodiscard]] TLMReportingService& realTimeLink();
 
-  // The connections are made before everything that has threads, because they block the end signals
-  // in every thread that starts after them.
+  // The connections are made before everything that has threads, because they block the signals
+  // that end the process, and every thread that starts later inherits this.
   const Configuration configuration;
   CounterStatisticsService statistics;
   Backpressure backpressure;
@@ -79,8 +79,8 @@ struct LinuxAdapters {
   InotifyNotifyService notify;
   SqlitePowerLogService powerLog{store, clock};
   TomlPreferenceService preferences;
-  // Uses the queues, which are members below and are destroyed first; close() ends it while they
-  // still exist.
+  // Uses the queues, which are destroyed first because they are members below.
+  // LinuxPlatform::close() therefore ends this thread while the queues still exist.
   CallbackThread linkCallbacks{dispatch};
   LocalTlmReportingService localLink{store, clock, linkCallbacks};
   NoneTlmReportingService noLink{statistics, linkCallbacks};

@@ -13,9 +13,10 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// How long the end of the service waits for jobs that run.
+// How long the end of the service waits for running jobs to end.
 constexpr std::chrono::seconds kJobsEndWithin{5};
-// How long it waits before that while the queues of sessions run their jobs.
+// Before that, the end of the service waits this long for the queues of sessions to run their
+// pending jobs.
 constexpr std::chrono::seconds kQueuesFinishWithin{5};
 
 const char* linkName(LinkBackend backend) {
@@ -42,12 +43,12 @@ const char* busName(BusKind kind) {
   return "";
 }
 
-// Blocks from this size on are mappings of their own, which free() returns to the system. Without a
-// fixed value, glibc raises the limit to the largest block that was ever freed. The summaries of
-// one long session would then stay in the heap until the process ends.
+// malloc() makes a mapping of its own for each block of at least this size, which free() returns to
+// the system. Without a fixed value, glibc raises the limit to the largest block that was ever
+// freed. The summaries of one long session would then stay in the heap until the process ends.
 constexpr int kMappedBytes = 256 * 1024;
-// How much free memory the end of the heap may keep. A busy service allocates and frees less than
-// this all the time, and does so without system calls.
+// How much free memory the heap may keep at its end. A busy service constantly allocates and frees
+// less than this, which then needs no system calls.
 constexpr int kKeptBytes = 2 * 1024 * 1024;
 
 void limitFreeMemory() {
@@ -111,24 +112,25 @@ Result<void, int> LinuxPlatform::open() {
 }
 
 bool LinuxPlatform::close() {
-  // First stop what adds jobs to the queues: captures reply through them.
+  // First stop what adds jobs to the queues. Captures add jobs for their replies.
   adapters_->diagnosticReporters.stop();
-  adapters_->notify.stop();  // it adds jobs to queues
-  // Stop traces before the queues: a stop of a session may wait for a trace that is still being
-  // read.
+  adapters_->notify.stop();  // adds the jobs of handlers
+  // Stop traces before the queues, because a stop of a session may wait for a trace that is still
+  // being read.
   adapters_->traces->stop();
   // A message that was answered without an error must reach the link. The queue of its session may
   // still hold it, because these queues have a lower priority than requests.
   adapters_->dispatch.finish(kQueuesFinishWithin);
   const bool ended = adapters_->dispatch.stop(kJobsEndWithin);
   ended ? adapters_->traces->close() : adapters_->traces->abandon();
-  // Stop the callbacks after the queues: then no session can request a callback.
+  // Stop the callbacks after the queues, when no session can request a callback any more.
   adapters_->linkCallbacks.stop();
   const auto& nats = adapters_->nats;
   const bool linkEnded = !nats || !*nats || (*nats)->close();
-  // Close the store after the link: the local link writes to it until its last message.
+  // Close the store after the link, because the local link writes messages to it until the link has
+  // ended.
   adapters_->store.close();
-  // Log the counters after everything that counts has ended: their sums agree only then.
+  // Log the counters after everything that counts has ended, because their sums agree only then.
   logStatistics(LogLevel::kInfo, Counters::kCounted);
   // Stop the log last, because everything above may log.
   adapters_->log->stop();

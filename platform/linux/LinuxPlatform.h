@@ -29,8 +29,9 @@ class LinuxPlatform {
   // Opens the store, then the socket, so that everything that is accepted can be stored.
   // The services must be installed. The code of a failure is the exit status of the process.
   Result<void, int> open();
-  // Ends the queues, writes what waits for the store, and logs the statistics. False when a job or
-  // the link does not end: the process must then end without destroying anything.
+  // Ends the queues, writes the records that wait for the store, and logs the statistics. Returns
+  // false when a job or the link does not end. The process must then end without destroying
+  // anything.
   [[nodiscard]] bool close();
 
  private:

@@ -209,11 +209,11 @@ class Snapshots(unittest.TestCase):
         # Two reports make one request. Each request was accepted or refused, and that was logged.
         counted = wait_for("the end of the last snapshot", lambda: next(
             (now for now in [counters(service)]
-             if now["delivered"] + now["dropped: another in work"] == 5000), None), pause=0.2)
+             if now["delivered"] + now["dropped: another in progress"] == 5000), None), pause=0.2)
         self.assertEqual(counted["received"], 5000)
         self.assertGreater(counted["delivered"], 0)
         # Requests continued while a capture was running.
-        self.assertGreater(counted["dropped: another in work"], 0)
+        self.assertGreater(counted["dropped: another in progress"], 0)
         self.assertEqual(service.stop(), 0)
         self.assertEqual(len(snapshots(service)), min(counted["delivered"], 20))
 

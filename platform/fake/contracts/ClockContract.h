@@ -27,7 +27,7 @@ TYPED_TEST_P(ClockContract, UptimesMoveOnWithTime) {
 
   this->harness_.letPass(std::chrono::milliseconds(20));
 
-  // The date is not compared: it may be set back at any time.
+  // The date is not compared, because it may be set back at any time.
   EXPECT_GE(clock.systemUptime() - system, std::chrono::milliseconds(19));
   EXPECT_GE(clock.processUptime() - process, std::chrono::milliseconds(19));
 }

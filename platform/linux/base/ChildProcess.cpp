@@ -21,24 +21,25 @@ namespace {
 
 using std::chrono::milliseconds;
 
-// The descriptors of ours that a child's descriptors are made from. Copies each one whose number
-// the child also uses: setting up one descriptor would otherwise replace the source of another.
+// The descriptors of this process that become the child's descriptors (the sources). Setting up a
+// descriptor of the child replaces the source that has the same number. Such a source is therefore
+// copied to another number first.
 class DescriptorSources {
  public:
   explicit DescriptorSources(const std::vector<ChildProgram::Descriptor>& descriptors) {
     for (const auto& descriptor : descriptors) largest_ = std::max(largest_, descriptor.number);
     for (const auto& [number, ours] : descriptors) sources_.push_back({number, sourceOf(ours)});
   }
-  // 0, or the errno of a copy that could not be made.
+  // 0, or the errno if a source could not be copied.
   [[nodiscard]] int error() const { return error_; }
-  // The largest number in the child; -1 if there is none.
+  // The largest number of a descriptor in the child; -1 if there is none.
   [[nodiscard]] int largest() const { return largest_; }
   [[nodiscard]] const std::vector<ChildProgram::Descriptor>& get() const { return sources_; }
 
  private:
   int sourceOf(int ours) {
-    // The copy gets a number above all those that the child uses. Setting those up then cannot
-    // replace the copy.
+    // The copy gets a number above all numbers that the child uses. Setting up the child's
+    // descriptors then cannot replace the copy.
     if (ours == ChildProgram::Descriptor::kNull || ours > largest_) return ours;
     UniqueFd& copy = copies_.emplace_back(::fcntl(ours, F_DUPFD_CLOEXEC, largest_ + 1));
     if (!copy) error_ = errno;
@@ -124,12 +125,12 @@ std::vector<char*> pointersTo(const std::vector<std::string>& texts) {
 }
 
 UniqueFd openProcess(pid_t pid) {
-  // The number instead of the function: <sys/pidfd.h> of Debian 12's C library declares it without
-  // C linkage for C++.
+  // Use the number of the system call: <sys/pidfd.h> of Debian 12's C library declares the function
+  // pidfd_open() without C linkage for C++.
   return UniqueFd(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
 }
 
-// For poll(): rounded up, and at most a day, because poll() takes an int.
+// A time-out for poll(): rounded up, and at most a day, because poll() takes an int.
 int millisecondsUntil(ChildProcess::Clock::time_point deadline) {
   const auto now = ChildProcess::Clock::now();
   if (deadline <= now) return 0;
@@ -159,8 +160,8 @@ Result<ChildProcess, int> ChildProcess::start(const ChildProgram& program) {
   const std::vector<char*> variables =
       program.environment ? pointersTo(*program.environment) : std::vector<char*>();
   pid_t pid = 0;
-  // posix_spawn() instead of fork(): between fork() and exec(), a program with threads may call
-  // hardly any function.
+  // Use posix_spawn() instead of fork(), because a program with threads may call hardly any
+  // function between fork() and exec().
   const int error =
       ::posix_spawnp(&pid, arguments.front(), actions.get(), attributes.get(), arguments.data(),
                      program.environment ? variables.data() : environ);
@@ -188,12 +189,13 @@ ChildProcess& ChildProcess::operator=(ChildProcess&& other) noexcept {
 }
 
 void ChildProcess::signal(int number) const {
-  // Signal only a child that has not been reaped: afterwards another process may have its ID.
+  // Signal only a child that has not been reaped, because afterwards another process may have its
+  // ID.
   if (pid_ != 0) ::kill(pid_, number);
 }
 
 void ChildProcess::signalGroup(int number) const {
-  // A child in our group is signalled alone, because the group includes this process.
+  // If the child is in our group, signal only the child, because the group includes this process.
   if (pid_ != 0) ::kill(group_ == ChildProgram::Group::kOurs ? pid_ : -pid_, number);
 }
 
@@ -217,7 +219,7 @@ bool ChildProcess::reap(int options) {
 }
 
 std::optional<ChildEnd> ChildProcess::waitUntil(Clock::time_point deadline) {
-  constexpr int kLookEvery = 10;  // milliseconds, if the child has no descriptor
+  constexpr int kLookEvery = 10;  // milliseconds between checks if the child has no pidfd
   while (!reap(WNOHANG)) {
     const int left = millisecondsUntil(deadline);
     if (left == 0) return std::nullopt;

@@ -45,8 +45,8 @@ struct ChildProgram {
 
 // How a child process ended.
 struct ChildEnd {
-  int status = -1;  // of its exit; -1 after a signal
-  int signal = 0;   // that ended it; 0 after an exit
+  int status = -1;  // the exit status; -1 if a signal ended the child
+  int signal = 0;   // the signal that ended the child; 0 if it exited
 
   [[nodiscard]] bool isSuccess() const { return status == 0; }
   // "ended with status 3" or "killed by signal 15"
@@ -71,7 +71,7 @@ class ChildProcess {
   ChildProcess& operator=(ChildProcess&& other) noexcept;
   ~ChildProcess() { kill(); }
 
-  // 0 once the child is reaped, or was detached.
+  // 0 after the child was reaped or detached.
   [[nodiscard]] pid_t pid() const { return pid_; }
   // Readable (poll) when the child has ended. A caller can wait for it together with other
   // descriptors. Owned by this object; -1 if the process had no free descriptor.
@@ -83,8 +83,8 @@ class ChildProcess {
   void signal(int number) const;
   void signalGroup(int number) const;
 
-  // Waits until the child ends, without a busy loop, at most until `deadline`. Returns std::nullopt
-  // if it is still running then.
+  // Waits until the child ends, at most until `deadline`, without a busy loop. Returns std::nullopt
+  // if the child is still running at the deadline.
   [[nodiscard]] std::optional<ChildEnd> waitUntil(Clock::time_point deadline);
   // Returns std::nullopt if the child is running.
   [[nodiscard]] std::optional<ChildEnd> poll() { return waitUntil(Clock::time_point::min()); }

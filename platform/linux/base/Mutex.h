@@ -46,8 +46,8 @@ class HALVOX_THREAD_ANNOTATION(scoped_lockable) MutexLock {
   Mutex& mutex_;
 };
 
-// A condition to wait on under a Mutex; a wait may return without a notification, and callers must
-// loop.
+// A condition to wait on under a Mutex. A wait may return without a notification. Callers must
+// therefore wait in a loop.
 class Condition {
  public:
   void wait(Mutex& mutex) HALVOX_REQUIRES(mutex) { condition_.wait(mutex); }

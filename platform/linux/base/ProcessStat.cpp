@@ -22,7 +22,7 @@ std::optional<ProcessStat> readStat(const char* path) {
 }  // namespace
 
 std::optional<ProcessStat> parseProcessStat(std::string_view text) {
-  // The name ends at the last parenthesis: no later field contains one.
+  // The name may contain parentheses. It ends at the last one, because no later field contains any.
   const std::size_t nameEnd = text.rfind(") ");
   if (nameEnd == std::string_view::npos) return std::nullopt;
   std::string_view rest = text.substr(nameEnd + 2);

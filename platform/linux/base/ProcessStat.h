@@ -15,15 +15,15 @@ struct ProcessStat {
 };
 
 // Parses the text of such a file. Returns std::nullopt if the text is malformed or ends before the
-// end of the start time. The command name in it may contain blanks, parentheses and line ends: each
-// process chooses its own name.
+// end of the start time. The command name in it may contain blanks, parentheses and line ends,
+// because each process chooses its own name.
 [[nodiscard]] std::optional<ProcessStat> parseProcessStat(std::string_view text);
 
 // Reads the file of a process. Returns std::nullopt if the process does not exist. Does not block.
 // Any thread may call it.
 [[nodiscard]] std::optional<ProcessStat> readProcessStat(pid_t pid);
 
-// Returns the same for this process. Also correct if /proc shows the processes of another PID
+// Reads the file of this process. Also correct if /proc shows the processes of another PID
 // namespace, where this process has another number than getpid() returns.
 [[nodiscard]] std::optional<ProcessStat> readOwnProcessStat();
 

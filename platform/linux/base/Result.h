@@ -21,22 +21,23 @@ struct Failure<void> {
   std::string message;
 };
 
-// A value, or why there is none. The caller must look before it takes either:
+// A value, or the reason why there is none. The caller must test which of the two exists before it
+// takes one:
 //
 //   Result<Settings> settings = readSettings(file);
 //   if (!settings) return settings.error();
 //   use(*settings);
 //
-// Taking the one that is not there ends the process. The members are those of C++23's
-// std::expected, and this becomes an alias of that one day. docs/decisions/0009-results.md says why
-// it is our own until then.
+// Taking the one that does not exist ends the process. The members are those of std::expected of
+// C++23, which can replace this class later. docs/decisions/0009-results.md says why the service
+// has a class of its own until then.
 template <typename Value, typename Code = void>
 class [[nodiscard]] Result {
  public:
   using Error = Failure<Code>;
 
-  // Implicit, so that a function can return its value or its error directly. Also takes whatever
-  // converts to a value, such as std::nullopt if the value is a std::optional.
+  // Implicit, so that a function can return its value or its error directly. Also takes anything
+  // that converts to a value, such as std::nullopt if the value is a std::optional.
   template <typename Source = Value>
   requires(std::is_convertible_v<Source, Value> &&
            !std::is_same_v<std::remove_cvref_t<Source>, Result> &&

@@ -11,8 +11,8 @@ namespace halvox::platform::linux_ {
 namespace {
 
 // If two threads compete for a processor, five steps leave about a third of it to the thread with
-// the lower priority, and ten steps about a tenth. Neither thread starves: a lock that it holds for
-// a few instructions is released soon.
+// the lower priority, and ten steps about a tenth. Neither thread starves. Even the slower one soon
+// releases a lock that it holds for a few instructions.
 int stepsBelowMainThread(ThreadPriority priority) {
   switch (priority) {
     case ThreadPriority::kNormal:
@@ -36,16 +36,16 @@ sigset_t blockAllSignals() {
 }  // namespace
 
 void setUpThread(std::string_view label) {
-  // The kernel refuses a longer name as a whole. The end of a label says more than its start, which
-  // all queues share.
+  // The kernel does not cut a longer name but refuses it. Keep the end of the label, because all
+  // queues share its start.
   constexpr std::size_t kLongestName = 15;
   while (label.size() > kLongestName) {
     const std::size_t dot = label.find('.');
     label.remove_prefix(dot == std::string_view::npos ? label.size() - kLongestName : dot + 1);
   }
   ::pthread_setname_np(::pthread_self(), std::string(label).c_str());
-  // The loop of the connections reads the signals from a descriptor. A thread that does not block
-  // them could be chosen to handle them.
+  // The event loop of the connections reads signals from a descriptor. If a thread did not block
+  // them, the kernel could deliver them to that thread instead.
   blockAllSignals();
 }
 

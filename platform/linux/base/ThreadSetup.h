@@ -25,7 +25,7 @@ void setUpThread(std::string_view label, ThreadPriority priority);
 // Blocks all signals for the calling thread while this object exists. A new thread inherits the
 // signal mask of the thread that creates it. A thread that is created meanwhile therefore never
 // receives a signal, not even before setUpThread(). A library needs this when it creates a thread
-// in another program: that program's signals must go to its own threads.
+// in another program, because that program's signals must go to its own threads.
 class SignalsBlocked {
  public:
   SignalsBlocked();

@@ -34,7 +34,7 @@ class UniqueHandle {
     const Raw old = std::exchange(raw_, raw);
     if (old != kNone && old != raw) static_cast<void>(kRelease(old));
   }
-  // Returns where a C function can store a new handle. Releases the old handle first.
+  // Releases the old handle and returns the address where a C function can store a new one.
   [[nodiscard]] Raw* out() noexcept {
     reset();
     return &raw_;

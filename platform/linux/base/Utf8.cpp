@@ -11,7 +11,7 @@ namespace {
 
 constexpr std::string_view kReplacement = "\xEF\xBF\xBD";
 constexpr std::size_t kWordSize = sizeof(std::uint64_t);
-// Each has the same value in every byte of the word.
+// Words with the same value in each of their bytes.
 constexpr std::uint64_t kEachByte = 0x0101010101010101;
 constexpr std::uint64_t kEachHighBit = 0x8080808080808080;
 
@@ -151,7 +151,8 @@ std::size_t appendEscaped(std::string& line, std::string_view text, std::size_t 
   while (taken < text.size()) {
     const std::string_view rest = text.substr(taken);
     const auto end = std::ranges::find_if_not(rest, isPlain);
-    // Append plain characters as one run: nearly all texts consist of plain characters only.
+    // Append plain characters as one run, because nearly all texts consist of plain characters
+    // only.
     if (const auto plain = static_cast<std::size_t>(end - rest.begin()); plain > 0) {
       const std::size_t fitting = std::min(plain, room);
       line += rest.substr(0, fitting);
@@ -165,7 +166,7 @@ std::size_t appendEscaped(std::string& line, std::string_view text, std::size_t 
         !step.valid ? hexEscape("\\x%02x", static_cast<unsigned char>(rest.front()))
         : isUnprintable(step.character) ? escaped(step.character)
                                         : std::string(rest.substr(0, step.length));
-    // An escape is never cut: half of one would have another meaning.
+    // Never cut an escape, because a part of it would have another meaning.
     if (part.size() > room) break;
     line += part;
     room -= part.size();

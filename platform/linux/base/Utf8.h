@@ -9,10 +9,10 @@ namespace halvox::platform::linux_ {
 // UTF-8 for the outer ring and the client library. Valid UTF-8 has no overlong forms, no surrogates
 // and nothing above U+10FFFF. All functions take any bytes, and any thread may call them.
 //
-// The inner ring cannot include this header. session/SummaryFileName.cpp has a line of its own,
-// which cuts valid text between two characters. The fake process service also has code of its own,
-// which replaces invalid bytes. The contract suite compares its results with those of the adapter,
-// which uses this header.
+// The inner ring cannot include this header. session/SummaryFileName.cpp therefore has its own code
+// to cut valid text between two characters, and the fake process service its own code to replace
+// invalid bytes. The contract suite runs the same tests on that fake and on the adapter, which uses
+// this header.
 
 // One step through bytes that should be UTF-8.
 struct Utf8Step {
@@ -28,7 +28,7 @@ struct Utf8Step {
 [[nodiscard]] bool isUtf8(std::string_view text);
 
 // Returns true for valid UTF-8 without a NUL, which is what D-Bus and C take as a text. It runs for
-// every message and therefore makes one pass: a separate search for the NUL would read the text
+// every message and therefore makes one pass. A separate search for the NUL would read the text
 // twice.
 [[nodiscard]] bool isUtf8WithoutNul(std::string_view text);
 

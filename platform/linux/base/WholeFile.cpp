@@ -52,11 +52,11 @@ bool isToBeOpened(const FileToRead& file, FileContent& content) {
 }
 
 void readAll(int descriptor, const FileToRead& file, FileContent& content) {
-  // Only a hint: files of /proc have the size 0, and a file may grow while it is read.
+  // Only a hint, because files of /proc have the size 0, and a file may grow while it is read.
   content.bytes.reserve(std::min<std::uint64_t>(content.size, file.most));
   std::array<char, kPieceSize> piece;
   while (true) {
-    // One byte more than wanted shows whether the file is longer.
+    // Read one byte more than wanted to find out whether the file is longer.
     const std::size_t room = std::min(piece.size(), file.most - content.bytes.size() + 1);
     const ssize_t count = ::read(descriptor, piece.data(), room);
     if (count < 0 && errno == EINTR) continue;
@@ -77,8 +77,8 @@ void readAll(int descriptor, const FileToRead& file, FileContent& content) {
 FileContent readWholeFile(const FileToRead& file) {
   FileContent content;
   if (!isToBeOpened(file, content)) return content;
-  // O_NONBLOCK: another process may have put a pipe in the file's place, and opening a pipe without
-  // a writer would block.
+  // O_NONBLOCK is needed because another process may have put a pipe in the file's place, and
+  // opening a pipe without a writer would block.
   const int links = file.links == FileToRead::Links::kRefused ? O_NOFOLLOW : 0;
   const UniqueFd descriptor(
       ::openat(file.directory, file.path, O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY | links));
@@ -86,7 +86,7 @@ FileContent readWholeFile(const FileToRead& file) {
     fail(content, errno);
     return content;
   }
-  // Check again: another file may have taken the name since the first check.
+  // Check again, because another file may have taken the name since the first check.
   struct stat status {};
   if (::fstat(descriptor.get(), &status) != 0) {
     fail(content, errno);

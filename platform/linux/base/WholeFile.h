@@ -42,7 +42,7 @@ struct FileContent {
   Outcome outcome = Outcome::kFailed;
   int error = 0;  // errno of kMissing and kFailed
   std::string bytes{};
-  // From the file system, when the file is opened; 0 before that.
+  // As the file system reports them; 0 if it has not reported them, for example for a missing file.
   std::uint64_t size = 0;  // 0 for the files of /proc
   mode_t mode = 0;         // type and permissions
 
@@ -53,7 +53,7 @@ struct FileContent {
 // Reads a small file in one piece. Blocks on the disk. With Kinds::kRegular it never waits for
 // another process. With Kinds::kAny it reads a pipe until the writer closes it; a pipe without a
 // writer gives an empty text. Does not rely on the file's size, which is 0 for files of /proc and
-// may grow meanwhile. Any thread may call it.
+// may change during the reading. Any thread may call it.
 [[nodiscard]] FileContent readWholeFile(const FileToRead& file);
 
 // Opens a directory for reading files below it. Returns an empty handle, with errno set, if it

@@ -123,7 +123,7 @@ TEST_F(WholeFileTest, NeitherPipesNorDevicesNorDirectoriesAreRead) {
 
 TEST_F(WholeFileTest, AnyKindReadsWhatIsWrittenIntoAPipe) {
   const std::string pipe = makePipe();
-  // Opened for reading and writing: the pipe then has a writer before the reader opens it.
+  // Open the pipe for reading and writing, so that it has a writer before the reader opens it.
   UniqueFd writer(::open(pipe.c_str(), O_RDWR | O_CLOEXEC));
   ASSERT_EQ(::write(writer.get(), "first ", 6), 6);
   FileContent content;

@@ -53,8 +53,8 @@ Failure<ConfigurationError> unreadable(const std::filesystem::path& file, int er
 }
 
 // Returns the file's text, or std::nullopt if the file does not exist. The file may be a pipe, such
-// as the one that a shell makes of <(command). Opening a pipe does not block: a pipe without a
-// writer must not delay the start.
+// as the one that a shell makes of <(command). Opening a pipe does not block, because a pipe
+// without a writer must not delay the start.
 Result<std::optional<std::string>, ConfigurationError> readText(const std::filesystem::path& file) {
   FileContent content =
       readWholeFile({.path = file.c_str(), .most = kLargestFile, .kinds = FileToRead::Kinds::kAny});
@@ -77,7 +77,7 @@ Result<std::optional<std::string>, ConfigurationError> readText(const std::files
 
 bool isNotEmpty(std::string_view text) { return !text.empty(); }
 
-// A zero and three octal digits. The first of the three must let the owner connect.
+// A mode is a zero and three octal digits, of which the first must let the owner connect.
 bool isMode(std::string_view text) {
   return text.size() == 4 && text[0] == '0' && (text[1] == '6' || text[1] == '7') &&
          std::ranges::all_of(text, [](char digit) { return digit >= '0' && digit <= '7'; });
@@ -124,7 +124,7 @@ void readStorage(TableReader table, Configuration::Storage& storage) {
   table.read("retention_days", kDays, days);
   table.read("max_megabytes", kMegabytes, megabytes);
   table.finish();
-  // Set last: the default depends on the directory that the file names.
+  // Set last, because the default depends on the directory that the file names.
   storage.root = root.empty() ? storage.directory / "root" : root;
   storage.retentionDays = static_cast<std::uint32_t>(days);
   storage.maxMegabytes = static_cast<std::uint32_t>(megabytes);
@@ -139,7 +139,7 @@ void readAnalytics(TableReader table, Configuration::Analytics& analytics) {
   table.finish();
 }
 
-// Printable ASCII without blanks: the NATS protocol separates names by blanks.
+// Printable ASCII without blanks, because the NATS protocol separates names by blanks.
 bool isGraphic(std::string_view text) {
   return !text.empty() && std::ranges::all_of(text, [](char character) {
     return character > ' ' && character <= '~';
@@ -167,13 +167,13 @@ bool isStreamName(std::string_view text) {
 
 void readLinkTls(TableReader table, std::optional<Configuration::Link::Tls>& result) {
   if (!table.isPresent()) return;
-  // Not emplace(): clang 14 finds no constructor for an aggregate.
+  // Do not use emplace(), because with clang 14 it cannot construct an aggregate.
   Configuration::Link::Tls& tls = *(result = Configuration::Link::Tls{});
   table.read("ca", tls.ca, kLongestPath);
   table.read("certificate", tls.certificate, kLongestPath);
   table.read("key", tls.key, kLongestPath);
   table.read("verify", tls.verify);
-  // Require the certificate and the key together: the link would ignore a key without a
+  // Require the certificate and the key together, because the link would ignore a key without a
   // certificate, and the servers would then refuse the link.
   if (tls.key.empty()) table.refuse("certificate", "a path together with link.tls.key");
   if (tls.certificate.empty()) table.refuse("key", "a path together with link.tls.certificate");
@@ -231,7 +231,7 @@ void readDirectory(TableReader table, std::filesystem::path& directory) {
   table.finish();
 }
 
-// Sets the directories that are in the storage directory unless the file says otherwise.
+// Sets the directories that are in the storage directory unless the file names others.
 void setDefaultDirectories(Configuration& configuration) {
   configuration.preferencesDirectory = configuration.storage.directory / "preferences";
   configuration.notifyDirectory = configuration.storage.directory / "notify";
@@ -249,9 +249,9 @@ void readDrivers(TableReader table, Configuration::Drivers& drivers) {
 Result<Configuration, ConfigurationError> parse(const std::string& file, std::string_view text,
                                                 const DefaultPlaces& places) {
   ConfigurationMistakes mistakes(file);
-  // Check before parsing: the parser limits the depth of brackets, but not the number of dots in a
-  // key. A key of 100,000 words makes 100,000 nested tables, and walking through them overflows the
-  // stack.
+  // Check before parsing, because the parser limits the depth of brackets, but not the number of
+  // dots in a key. A key of 100,000 words makes 100,000 nested tables, and walking through them
+  // overflows the stack.
   if (const auto line = lineNestedTooDeep(text)) {
     mistakes.add(
         {static_cast<toml::source_index>(*line), 1},
@@ -270,8 +270,8 @@ Result<Configuration, ConfigurationError> parse(const std::string& file, std::st
   TableReader root(&parsed.table(), "", mistakes);
   readListener(root.table("listener"), configuration.listener);
   readStorage(root.table("storage"), configuration.storage);
-  // Set them after the storage table, which names their parent directory, and before the tables
-  // that may replace them.
+  // Set the defaults of other directories after reading [storage], which names their parent
+  // directory, and before reading the tables that may replace them.
   setDefaultDirectories(configuration);
   readDirectory(root.table("preferences"), configuration.preferencesDirectory);
   readDirectory(root.table("notify"), configuration.notifyDirectory);
@@ -284,8 +284,8 @@ Result<Configuration, ConfigurationError> parse(const std::string& file, std::st
   configuration.device = root.table("device").readValues();
   readDrivers(root.table("drivers"), configuration.drivers);
   root.finish();
-  // Check this after all tables: the first mistake in the text may be in the table that is read
-  // last.
+  // Check for mistakes after all tables, because the first mistake in the text may be in the table
+  // that is read last.
   if (mistakes.first().has_value()) return *mistakes.first();
   return configuration;
 }
@@ -326,7 +326,7 @@ Result<Configuration, ConfigurationError> loadConfiguration(const DefaultPlaces&
 }
 
 Result<std::filesystem::path, ConfigurationError> configuredSocket() {
-  // Load without a default socket: if the result then has a socket, the file names it.
+  // Load without a default socket. If the result then has a socket, the file names it.
   auto loaded = loadConfiguration({.socket = {}, .storageDirectory = defaultStorageDirectory()});
   if (loaded) return std::move(loaded->listener.socket);
   const bool isHidden =

@@ -90,9 +90,9 @@ struct Configuration {
   FeatureSwitches features;  // [features.Domain]: name to switch
 };
 
-// Why a configuration cannot be used. The message of the failure is one line for the user: for a
-// file with a mistake "FILE:LINE:COLUMN: KEY: expected X, found Y", for an unreadable file its name
-// and the reason.
+// Why a configuration cannot be used. The message of a failure with this code is one line for the
+// user: for a file with a mistake "FILE:LINE:COLUMN: KEY: expected X, found Y", for an unreadable
+// file its name and the reason.
 enum class ConfigurationError : std::uint8_t {
   kWrong,       // a mistake in the file: exit status 78
   kUnreadable,  // the file cannot be read: exit status 66
@@ -102,7 +102,7 @@ enum class ConfigurationError : std::uint8_t {
 // (~/.config when unset), else /etc/halvox/halvox.toml.
 std::filesystem::path configurationPath();
 
-// The places that are used when the file does not name them.
+// The paths that the service uses if the file does not name others.
 struct DefaultPlaces {
   std::filesystem::path socket;
   std::filesystem::path storageDirectory;
@@ -122,8 +122,8 @@ Result<Configuration, ConfigurationError> loadConfiguration(
     const DefaultPlaces& places = placesOfService());
 
 // Returns the socket that the configuration names, for programs that look for the service; empty if
-// it names none. Also empty if this user may not read the file and $HALVOX_CONFIG does not name it:
-// the system's file may be readable only by the service.
+// it names none. Also empty if this user may not read the file and $HALVOX_CONFIG does not name it,
+// because the system's file may be readable only by the service.
 Result<std::filesystem::path, ConfigurationError> configuredSocket();
 
 }  // namespace halvox::platform::linux_

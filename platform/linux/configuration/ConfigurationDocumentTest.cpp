@@ -55,7 +55,7 @@ std::string documentedDefaults() {
   for (std::string line; std::getline(lines, line);) {
     std::smatch match;
     if (line.starts_with("### ")) {
-      // Skip [link.tls]: its presence alone changes the configuration.
+      // Skip [link.tls], because its presence alone changes the configuration.
       isInTable = std::regex_match(line, match, kHeading);
       if (isInTable) text += match[1].str() + "\n";
     } else if (isInTable && std::regex_search(line, match, kDefault)) {

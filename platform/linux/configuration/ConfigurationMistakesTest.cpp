@@ -157,7 +157,7 @@ TEST_F(ConfigurationMistakesTest, SyntaxErrorIsReportedWithItsPlace) {
 }
 
 TEST_F(ConfigurationMistakesTest, TextThatIsNotUtf8IsAMistake) {
-  // The reported place is that of the last character before the mistake.
+  // The parser reports the place of the last character before the mistake.
   EXPECT_THAT(mistake("[listener]\nsocket = \"/\xFF\"\n"),
               StartsWith("2:11: the file: expected TOML, found a mistake: "));
 }

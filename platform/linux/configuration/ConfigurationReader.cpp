@@ -35,8 +35,8 @@ std::string found(const toml::node& node) {
 }
 
 std::size_t editDistance(std::string_view left, std::string_view right) {
-  // One row of the usual table is enough: each number depends only on its own row and the previous
-  // one.
+  // One row of the table of distances is enough, because each number depends only on its own row
+  // and the previous one.
   std::vector<std::size_t> row(right.size() + 1);
   std::iota(row.begin(), row.end(), std::size_t{0});
   for (std::size_t i = 0; i < left.size(); ++i) {
@@ -50,8 +50,8 @@ std::size_t editDistance(std::string_view left, std::string_view right) {
   return row.back();
 }
 
-// The known key with the smallest edit distance to `key`. Only the first bytes of `key` are
-// compared: the cost grows with its length, and a long key is not a typing mistake.
+// The known key with the smallest edit distance to `key`. Compares only the first bytes of `key`,
+// because the cost grows with the length and a long key is not a typing mistake.
 std::string_view closest(std::string_view key, const std::vector<std::string>& known) {
   const std::string_view start = key.substr(0, kLongestQuote);
   const auto best = std::ranges::min_element(
@@ -114,7 +114,8 @@ void TableReader::read(std::string_view key, std::vector<std::string>& result) {
   if (node == nullptr) return;
   const toml::array* array = node->as_array();
   if (array == nullptr) return expected(*node, key, kExpected);
-  // Collect the values separately: after a mistake, `result` must still have its default.
+  // Collect the values in another variable, because after a mistake, `result` must still have its
+  // default.
   std::vector<std::string> texts;
   for (const toml::node& element : *array) {
     const auto* text = element.as_string();
@@ -246,8 +247,8 @@ void TableReader::finish() {
 }
 
 const toml::node* TableReader::find(std::string_view key) {
-  // Note the name even if the file does not have the key: the error for an unknown key suggests one
-  // of these names.
+  // Remember the name even if the file does not have the key, because the error for an unknown key
+  // suggests one of these names.
   known_.emplace_back(key);
   return table_ == nullptr ? nullptr : table_->get(key);
 }

@@ -21,8 +21,8 @@
 
 namespace halvox::platform::linux_ {
 
-// Collects the mistakes of one file and keeps the one that comes first in the text, whatever the
-// order of the checks: users fix a file from the top.
+// Receives the mistakes of one file and keeps the one that comes first in the text, whatever the
+// order of the checks, because users fix a file from the top.
 class ConfigurationMistakes {
  public:
   explicit ConfigurationMistakes(std::string file) : file_(std::move(file)) {}
@@ -43,10 +43,10 @@ struct NumberRange {
   std::uint64_t greatest;
 };
 
-// One table of the file. Every read names its key: finish() can then report the keys that were not
-// read. `result` holds the default before a read. A read leaves it unchanged if the key is absent
-// or the value is not as expected. In the second case it also adds a mistake. Refers to the parsed
-// file and to `mistakes`, which must outlive it. Belongs to one thread.
+// One table of the file. Remembers the keys that were read, so that finish() can report the others.
+// Before a read, `result` holds the default. The read leaves `result` unchanged if the key is
+// absent or the value is not as expected. In the second case the read also adds a mistake. Refers
+// to the parsed file and to `mistakes`, which must outlive it. Belongs to one thread.
 class TableReader {
  public:
   // `table` is null for a table that the file does not have. `name` is empty for the root.
@@ -57,8 +57,8 @@ class TableReader {
   void read(std::string_view key, bool& result);
   void read(std::string_view key, std::string& result);  // not empty
   void read(std::string_view key, std::vector<std::string>& result);
-  // Reads a text, or a list of at least one, that must satisfy `matches`; `what` describes to the
-  // user what is expected.
+  // Reads one text, or a list of at least one text. Each text must satisfy `matches`. `what`
+  // describes to the user what is expected.
   using TextForm = bool (*)(std::string_view);
   void readText(std::string_view key, TextForm matches, std::string_view what, std::string& result);
   void readTexts(std::string_view key, TextForm matches, std::string_view what,
@@ -76,7 +76,7 @@ class TableReader {
   [[nodiscard]] std::map<std::string, bool, std::less<>> readSwitches();
 
   [[nodiscard]] bool isPresent() const { return table_ != nullptr; }
-  // Adds a mistake for `key`, if it is present; `what` describes what was expected.
+  // Adds a mistake for `key` if the file has it; `what` describes what was expected.
   void refuse(std::string_view key, std::string_view what);
   // Adds a mistake for each key that was not read. Call it last.
   void finish();

@@ -16,12 +16,13 @@ inline constexpr std::chrono::seconds kHandshakeTimeout{30};
 // The time from the first byte of a message to its last. Longer than kHandshakeTimeout, because a
 // message may have 32 MiB.
 inline constexpr std::chrono::seconds kMessageTimeout{60};
-// Permission bits of the socket of a system service: the audio programs of all users connect to it.
+// Permission bits of the socket of a system service, to which the audio programs of all users
+// connect.
 inline constexpr std::uint32_t kSocketModeOfSystem = 0666;
 
 // [storage] Days. A month covers "it broke after the last update" without growing forever.
 inline constexpr std::uint32_t kRetentionDays = 30;
-// MiB of database and write-ahead log together: room for roughly a million records of 500 bytes,
+// MiB of database and write-ahead log together. Enough for roughly a million records of 500 bytes,
 // and little on the disk of a desktop machine.
 inline constexpr std::uint32_t kStorageMegabytes = 512;
 

@@ -7,13 +7,14 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Counts brackets and dots through a text, outside quotes and comments. Does not parse and does not
-// recurse: the text may be anything.
+// Counts the brackets and dots of a text outside quotes and comments. Does not parse and does not
+// recurse, because the text may be anything.
 class NestingScan {
  public:
   explicit NestingScan(std::string_view text) : rest_(text) {}
 
-  // Returns the bytes read when the nesting becomes too deep; none if it never does.
+  // Returns the number of bytes up to the place where the nesting becomes too deep; none if it
+  // never does.
   std::optional<std::size_t> find() {
     const std::size_t size = rest_.size();
     while (!rest_.empty()) {
@@ -30,7 +31,7 @@ class NestingScan {
     rest_.remove_prefix(1);
     const bool beginsLine = isLineStart_;
     isLineStart_ = character == '\n' || (beginsLine && (character == ' ' || character == '\t'));
-    // A dot in a number counts too. The dot counts only until the number ends: the result is at
+    // A dot in a number counts, too, but only until the number ends. The result is therefore at
     // most one level too high.
     if (character == '.') {
       deepen(1);

@@ -8,8 +8,8 @@
 namespace halvox::platform::linux_ {
 
 Finding readBounded(const std::filesystem::path& file, std::size_t most) {
-  // Links are refused: a capture runs with the rights of the service, and links in trees that
-  // others write could lead anywhere.
+  // Links are refused, because a capture runs with the rights of the service and a link in a
+  // directory that others write could lead anywhere.
   FileContent content = readWholeFile({.path = file.c_str(),
                                        .most = most,
                                        .links = FileToRead::Links::kRefused,

@@ -6,7 +6,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The result of collecting one thing: bytes, or the reason why there are none.
+// The result of collecting one part of a capture: bytes, or the reason why there are none.
 struct Finding {
   std::string bytes{};
   bool isCut = false;     // there was more than `bytes`

@@ -46,7 +46,8 @@ ReadEnd readOutput(int descriptor, std::size_t most, const CaptureDeadline& dead
       output.resize(most);
       return ReadEnd::kTooMuch;
     }
-    // Test the time here too: poll() never times out while a program prints without a pause.
+    // Test the time here, too, because poll() never times out while a program prints without a
+    // pause.
     if (deadline.hasPassed()) return ReadEnd::kTimeOver;
   }
 }
@@ -82,7 +83,7 @@ Finding runProgram(const std::vector<std::string>& command, std::size_t most,
     return Finding::failed(isMissing ? command.front() + " is not installed"
                                      : child.error().message);
   }
-  // Close our copy of the writing end: while it is open, reading never reaches the end.
+  // Close our copy of the writing end, because while it is open, reading never reaches the end.
   pipe->writer.reset();
   Finding finding;
   const ReadEnd end = readOutput(pipe->reader.get(), most, deadline, finding.bytes);
@@ -92,7 +93,7 @@ Finding runProgram(const std::vector<std::string>& command, std::size_t most,
       return Finding::failed(command.front() + ": " + ended->text());
     }
   }
-  // Kill the whole group: the program may have started others that hold the pipe.
+  // Kill the whole group, because the program may have started others that hold the pipe.
   child->kill();
   if (end == ReadEnd::kTooMuch) {
     finding.isCut = true;

@@ -77,7 +77,7 @@ TEST_F(ChildTest, GetsNeitherOurSignalsNorOurVariables) {
   const std::size_t ignored = status.bytes.find("SigIgn:");
   ASSERT_NE(ignored, std::string::npos);
   EXPECT_THAT(status.bytes, HasSubstr("SigBlk:\t0000000000000000"));
-  // Test only one signal: two signals that the C library uses itself are always ignored.
+  // Test only one signal, because two signals that the C library uses itself are always ignored.
   EXPECT_EQ(std::stoull(status.bytes.substr(ignored + 8), nullptr, 16) & (1U << (SIGPIPE - 1)), 0U);
   EXPECT_THAT(environment.bytes, Not(HasSubstr("HALVOX_SECRET")));
 }

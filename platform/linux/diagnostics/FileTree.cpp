@@ -12,8 +12,8 @@ namespace fs = std::filesystem;
 // is arbitrary, would decide which files are beyond the bounds.
 std::vector<fs::path> filesBelow(const fs::path& root, const TreeBounds& bounds,
                                  const CaptureDeadline& deadline, Tree& tree) {
-  // Directories and other entries count too: a large tree with hardly any files must not be walked
-  // to its end.
+  // Directories and other entries count too, because a large tree with hardly any files must not be
+  // walked to its end.
   constexpr std::size_t kLooksPerFile = 16;
   std::vector<fs::path> paths;
   std::size_t looks = 0;
@@ -31,7 +31,7 @@ std::vector<fs::path> filesBelow(const fs::path& root, const TreeBounds& bounds,
     }
     std::error_code ignored;
     if (at.depth() + 1 >= bounds.depth) at.disable_recursion_pending();
-    // Links are not followed; they could lead out of the tree, or in circles.
+    // Do not follow links, because they could lead out of the tree or in circles.
     if (at->is_symlink(ignored) || !at->is_regular_file(ignored)) continue;
     paths.push_back(at->path());
   }
@@ -50,7 +50,7 @@ Tree readTree(const fs::path& root, const TreeBounds& bounds, const CaptureDeadl
       break;
     }
     Finding finding = readBounded(path, std::min(bounds.bytesOfFile, room));
-    // A file that cannot be read does not affect the others.
+    // Count a file that cannot be read, and continue with the others.
     if (!finding.isCollected()) {
       ++tree.unreadable;
       continue;

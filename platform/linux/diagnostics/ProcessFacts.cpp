@@ -63,8 +63,8 @@ class Facts {
     add(key, replaceInvalidUtf8(finding.bytes));
   }
   [[nodiscard]] Dictionary take() {
-    // A capture says what could not be read, and why. Otherwise a reader could conclude that it
-    // does not exist.
+    // A capture says what could not be read, and why. Otherwise a reader could conclude that there
+    // was nothing to read.
     if (!failures_.empty()) facts_.set("not_readable", failures_);
     return std::move(facts_);
   }
@@ -147,7 +147,7 @@ void addMaps(Facts& facts, const fs::path& process) {
     begin = end + 1;
   }
   std::vector<std::pair<std::string, Mapped>> bySize(all.begin(), all.end());
-  // The largest first, because only kMostMappedFiles are kept.
+  // Sort the largest first, because only kMostMappedFiles are kept.
   std::ranges::stable_sort(bySize, std::ranges::greater{},
                            [](const auto& entry) { return entry.second.bytes; });
   Mapped sum;
@@ -189,8 +189,8 @@ Dictionary processFacts(const fs::path& procRoot, std::string_view name,
   std::vector<Value> processes;
   for (const std::int32_t pid : numberedEntries(procRoot, kMostOpenFiles, error)) {
     if (deadline.hasPassed()) break;
-    // Search by name, because a signature has nothing else. Several processes may have the same
-    // name.
+    // Search by name, because a signature identifies a process only by its name. Several processes
+    // may have the same name.
     if (commandName(procRoot / std::to_string(pid)) != name) continue;
     ++found;
     if (processes.size() < kMostProcesses) processes.emplace_back(factsOf(procRoot, pid));

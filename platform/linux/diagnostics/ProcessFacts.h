@@ -11,9 +11,9 @@ namespace halvox::platform::linux_ {
 // Collects what the kernel knows about the processes with command name `name` (at most 15 bytes, as
 // the kernel keeps it): status, command line, limits, control group, a summary of the memory
 // mappings, the number of open files, and the threads. Never reads the environment, the content of
-// open files or memory: these may hold a user's secrets. Facts that cannot be read are listed under
-// "not_readable" with the reason. May block on the disk, but on nothing else. Stops at the
-// deadline.
+// open files or memory, because these may hold a user's secrets. Facts that cannot be read are
+// listed under "not_readable" with the reason. May block on the disk, but on nothing else. Stops at
+// the deadline.
 //
 //   {"name": …, "found": <number>, "processes": [{"pid": …, "status": …, …}]}
 //

@@ -100,8 +100,8 @@ Result<void> SnapshotArchive::finish() {
   writer_->handle.reset();
   if (auto done = written(); !done) return done;
   struct stat status {};
-  // Sync before the archive gets its name: after a power cut, an archive with a name must be
-  // complete.
+  // Sync before the archive gets its name, because after a power cut, an archive with a name must
+  // be complete.
   if (::fsync(writer_->file.get()) != 0 || ::fstat(writer_->file.get(), &status) != 0) {
     return Failure<>{path_.native() + ": " + errnoText(errno)};
   }

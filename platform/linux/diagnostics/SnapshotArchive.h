@@ -12,12 +12,12 @@ namespace halvox::platform::linux_ {
 
 // Writes one tar archive (pax format, zstd compression, mode 0600) under a temporary name. The
 // destructor deletes the file unless keep() was called. Belongs to one thread and one owner. All
-// functions but the getters block on the disk. After a failure, only destruction makes sense.
+// functions but the getters block on the disk. After a failure, the object can only be destroyed.
 //
 //   open(); add() for each file; finish(); rename the file; keep()
 class SnapshotArchive {
  public:
-  // `mostBytes` bounds the content before compression.
+  // `mostBytes` limits the size of the content before compression.
   SnapshotArchive(std::filesystem::path temporaryPath, std::uint64_t mostBytes);
   SnapshotArchive(const SnapshotArchive&) = delete;
   SnapshotArchive& operator=(const SnapshotArchive&) = delete;

@@ -49,8 +49,8 @@ SnapshotCollector::SnapshotCollector(const SnapshotRequest& request, const Snaps
                                      SnapshotArchive& archive, const CaptureDeadline& deadline)
     : request_(request), sources_(sources), archive_(archive), deadline_(deadline) {}
 
-// Parts that change quickly come first: they must show the moment of the request. Parts that may
-// take long come last: they can use up the time without costing another part.
+// Parts that change quickly come first, because they must show the moment of the request. Parts
+// that may take long come last: if they use up the time, no other part is lost.
 Result<void> SnapshotCollector::collect() {
   addSignature();
   addRequest();
@@ -67,8 +67,8 @@ void SnapshotCollector::addSignature() {
   addPart("signature.json", [this] { return Finding{.bytes = json(request_.signature)}; });
 }
 
-// Omit this part if a request has nothing but its signature. The duration is only recorded, because
-// a snapshot shows one moment.
+// Omits this part if the request has nothing but its signature. The duration is recorded but not
+// waited for, because a snapshot shows one moment.
 void SnapshotCollector::addRequest() {
   if (!request_.event && !request_.payload && request_.durationSeconds == 0) return;
   addPart("request.json", [this] {
@@ -165,7 +165,7 @@ void SnapshotCollector::addPart(const char* name, const std::function<Finding()>
   if (isOver()) return;
   const Clock::time_point begun = Clock::now();
   Finding finding = deadline_.hasPassed() ? Finding::failed("the time limit was reached") : find();
-  // If the end of the service interrupts a capture, the whole capture is dropped.
+  // Drop the whole capture if the end of the service interrupts it.
   if (deadline_.stop().isRaised()) {
     result_ = Failure<>{"the service is ending"};
     return;

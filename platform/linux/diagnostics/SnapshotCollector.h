@@ -39,8 +39,8 @@ struct SnapshotSources {
 
 // Collects the parts of one snapshot into an archive. The last part is a manifest, which lists each
 // part with its size and the time that it took, or with the reason why it is missing. A part that
-// cannot be collected, or for which no time or room remains, is not a failure of the snapshot. Made
-// for one snapshot. Belongs to the thread that takes it.
+// cannot be collected, or for which no time or no space in the archive remains, is not a failure of
+// the snapshot. Made for one snapshot. Belongs to the thread that takes it.
 class SnapshotCollector {
  public:
   // Does not own its arguments, which must outlive it.

@@ -42,8 +42,8 @@ std::string_view textOf(const Dictionary& signature, const char* key) {
 
 }  // namespace
 
-// The thread of snapshots and its work. Shared by the service and its reporters, which may outlive
-// the service.
+// The thread that takes snapshots, and its work. Shared by the service and its reporters, which may
+// outlive the service.
 class SnapshotDiagnosticReporterService::Worker {
  public:
   using Reply = AILDiagnosticReporter::Reply;
@@ -55,7 +55,7 @@ class SnapshotDiagnosticReporterService::Worker {
         directory_(options_.storageDirectory),
         received_(partners_.statistics.counter("diagnostics", "received")),
         delivered_(partners_.statistics.counter("diagnostics", "delivered")),
-        busy_(partners_.statistics.counter("diagnostics", "dropped: another in work")),
+        busy_(partners_.statistics.counter("diagnostics", "dropped: another in progress")),
         failed_(partners_.statistics.counter("diagnostics", "dropped: cannot be written")),
         ending_(partners_.statistics.counter("diagnostics", "dropped: service ending")) {}
   ~Worker() { stop(); }
@@ -106,7 +106,7 @@ void SnapshotDiagnosticReporterService::Worker::request(SnapshotRequest request,
   const Taken taken = tryTake(work);
   if (taken == Taken::kTaken) return;
   (taken == Taken::kBusy ? busy_ : ending_).add();
-  // Reply from another thread: callers rely on this function returning before the reply.
+  // Reply from another thread, because callers rely on this function returning before the reply.
   dispatch().asyncAfterOnBackgroundQueue(
       std::chrono::nanoseconds(0),
       [reply = std::move(work.reply), why = taken == Taken::kBusy ? kBusy : kEnding] {
@@ -121,7 +121,7 @@ SnapshotDiagnosticReporterService::Worker::Taken SnapshotDiagnosticReporterServi
   if (isInWork_) return Taken::kBusy;
   isInWork_ = true;
   waiting_.emplace(std::move(work));
-  // The first request starts the thread: most services never take a snapshot.
+  // The first request starts the thread, because most services never take a snapshot.
   if (!thread_.joinable()) thread_ = std::thread(&Worker::run, this);
   wakeUp_.notifyOne();
   return Taken::kTaken;
@@ -136,7 +136,7 @@ void SnapshotDiagnosticReporterService::Worker::stop() {
   std::thread ended;
   {
     const MutexLock lock(mutex_);
-    // Ends every wait of a capture: each of them polls this flag.
+    // This ends every wait of a capture, because each of them polls this flag.
     stop_.raise();
     wakeUp_.notifyOne();
     ended = std::move(thread_);
@@ -167,7 +167,7 @@ void SnapshotDiagnosticReporterService::Worker::carryOut(const Work& work) {
   const std::chrono::duration<double> took = std::chrono::steady_clock::now() - begun;
   const Dictionary response = conclude(work.request, snapshot, took.count());
   {
-    // Reset this before the reply: its receiver may request the next snapshot at once.
+    // Reset this before the reply, because its receiver may request the next snapshot at once.
     const MutexLock lock(mutex_);
     isInWork_ = false;
   }
@@ -184,7 +184,7 @@ Result<Snapshot> SnapshotDiagnosticReporterService::Worker::capture(
                           .dumpWithin = options_.dumpWithin};
   {
     const MutexLock lock(mutex_);
-    // Copy the source: calling it may wait, and must not hold the lock.
+    // Copy the source and call it without the lock, because the call may wait.
     sources.state = state_;
   }
   const CaptureDeadline deadline(stop_, std::chrono::steady_clock::now() + options_.collectWithin);
@@ -208,11 +208,11 @@ Dictionary SnapshotDiagnosticReporterService::Worker::conclude(const SnapshotReq
     if (errorLines_.tryPass()) log_.error("cannot take a snapshot: ", snapshot.error().message);
     return errorReply(snapshot.error().message);
   }
-  // Delete old snapshots only after the new one has its name: a failed capture must not cost an old
-  // snapshot.
+  // Delete old snapshots only after the new one has its name, because a failed capture must not
+  // cost an old snapshot.
   directory_.keepNewest(options_.keep, snapshot->path);
-  // Record the snapshot only after the file has its name: a record must not name a file that does
-  // not exist.
+  // Record the snapshot only after the file has its name, because a record must not name a file
+  // that does not exist.
   if (partners_.recorder != nullptr) {
     partners_.recorder->recordSnapshot(request.time, request.signature, snapshot->path);
   }

@@ -54,15 +54,16 @@ class SnapshotDiagnosticReporterService final : public DiagnosticReporterService
   ~SnapshotDiagnosticReporterService() override;
 
   [[nodiscard]] std::shared_ptr<AILDiagnosticReporter> createReporter() override;
-  // Calls the source on the thread of snapshots, for each snapshot until stop().
+  // The service calls the source on the thread that takes snapshots, once for each snapshot, until
+  // stop().
   void setStateSource(StateSource source) override;
 
   // Deletes the unfinished snapshot of a service that was killed. Call it before the first request,
   // after the lock on the storage directory was taken.
   void removeLeftovers() const;
   // Aborts the current snapshot, which is answered with an error and leaves no file, and ends the
-  // thread. Blocks until then. Idempotent. Must not be called from a reply: the thread would wait
-  // for itself.
+  // thread. Blocks until then. Idempotent. Must not be called from a reply, because the thread
+  // would wait for itself.
   void stop();
 
  private:

@@ -130,7 +130,7 @@ TEST_F(SnapshotDiagnosticReporterServiceTest, RequestDuringAnotherIsRefusedAtOnc
   platform.dispatch.advance(std::chrono::nanoseconds(0));
 
   EXPECT_EQ(textOf(responseOf(std::move(second)), "error"), "another snapshot is being taken");
-  EXPECT_EQ(counted("dropped: another in work"), 1U);
+  EXPECT_EQ(counted("dropped: another in progress"), 1U);
   answer({});
   EXPECT_FALSE(responseOf(std::move(first)).contains("error"));
   expectBalance();

@@ -59,8 +59,8 @@ bool isSnapshotName(std::string_view name) {
 int renameToFree(const fs::path& from, const fs::path& to) {
   if (::renameat2(AT_FDCWD, from.c_str(), AT_FDCWD, to.c_str(), RENAME_NOREPLACE) == 0) return 0;
   if (errno != EINVAL && errno != ENOSYS) return errno;
-  // The file system does not support this flag. Testing first is safe, because no other program
-  // writes here.
+  // The file system does not support this flag. Testing whether the name exists is safe, because no
+  // other program writes here.
   if (::access(to.c_str(), F_OK) == 0) return EEXIST;
   return ::rename(from.c_str(), to.c_str()) == 0 ? 0 : errno;
 }
@@ -114,7 +114,7 @@ Result<fs::path> SnapshotDirectory::publish(Date time, std::string_view type,
   const std::string stamp = stampOf(time);
   const std::string rest = "-" + namePart(type) + "-" + namePart(subType) + std::string(kSuffix);
   // Number snapshots of the same second upwards. The name of a deleted snapshot must not be used
-  // again: the store's records may still refer to it.
+  // again, because the store's records may still refer to it.
   int first = 1;
   for (const fs::path& path : newestFirst()) {
     const std::string name = path.filename().string();
@@ -129,7 +129,7 @@ Result<fs::path> SnapshotDirectory::publish(Date time, std::string_view type,
     const fs::path to = path_ / name;
     error = renameToFree(temporaryPath(), to);
     if (error != 0) continue;
-    // Sync the directory: until then the new name is not on the disk.
+    // Sync the directory, because the new name is not on the disk until then.
     syncDirectory(path_);
     return to;
   }
@@ -167,7 +167,7 @@ std::vector<fs::path> SnapshotDirectory::newestFirst() const {
 void SnapshotDirectory::keepNewest(std::size_t count, const fs::path& justWritten) const {
   std::size_t kept = 1;  // the one just written
   for (const fs::path& path : newestFirst()) {
-    // Keep this one even if others look newer: the clock may have been set back.
+    // Keep this snapshot even if others look newer, because the clock may have been set back.
     if (path == justWritten) continue;
     if (kept < count) {
       ++kept;

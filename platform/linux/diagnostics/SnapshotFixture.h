@@ -61,7 +61,7 @@ class SnapshotFixture : public ::testing::Test {
     return platform.statistics.value("diagnostics", name);
   }
   void expectBalance() const {
-    EXPECT_EQ(counted("received"), counted("delivered") + counted("dropped: another in work") +
+    EXPECT_EQ(counted("received"), counted("delivered") + counted("dropped: another in progress") +
                                        counted("dropped: cannot be written") +
                                        counted("dropped: service ending"));
   }

@@ -18,7 +18,7 @@ constexpr std::chrono::seconds kVersionWithin{1};
 Dictionary kernel() {
   utsname names{};
   ::uname(&names);
-  // Omits the host name: it identifies a person and does not explain a fault.
+  // Omits the host name, because it can identify a person and does not explain a fault.
   return {{"name", names.sysname},
           {"release", names.release},
           {"version", names.version},
@@ -31,8 +31,8 @@ std::string trimmed(std::string_view text) {
   return replaceInvalidUtf8(text.substr(begin, text.find_last_not_of(" \t\r\n") - begin + 1));
 }
 
-// Parses lines of the form KEY="value". Leaves escapes within quotes as they are: they hardly occur
-// in os-release.
+// Parses lines of the form KEY="value". Leaves escapes within quotes as they are, because they
+// hardly occur in os-release.
 Dictionary assignments(std::string_view text) {
   Dictionary entries;
   for (std::size_t begin = 0; begin < text.size();) {

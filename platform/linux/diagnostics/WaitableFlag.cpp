@@ -11,8 +11,8 @@ namespace halvox::platform::linux_ {
 WaitableFlag::WaitableFlag() : event_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)) {}
 
 void WaitableFlag::raise() {
-  // Raise the flag before the descriptor becomes readable: a thread that wakes up must find it
-  // raised.
+  // Raise the flag before the descriptor becomes readable, because a thread that wakes up must find
+  // the flag raised.
   raised_.store(true, std::memory_order_release);
   const std::uint64_t one = 1;
   static_cast<void>(!::write(event_.get(), &one, sizeof one));

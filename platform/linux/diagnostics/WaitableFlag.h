@@ -15,8 +15,8 @@ class WaitableFlag {
  public:
   WaitableFlag();
 
-  // Raises the flag. Never blocks. A thread that sees the flag raised also sees everything that
-  // this thread wrote before.
+  // Raises the flag. Never blocks. A thread that sees the flag raised also sees everything that the
+  // raising thread wrote before.
   void raise();
   [[nodiscard]] bool isRaised() const { return raised_.load(std::memory_order_acquire); }
   // Readable (poll) once the flag is raised. Owned by the flag; -1 if there is none.

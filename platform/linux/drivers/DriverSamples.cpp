@@ -157,8 +157,8 @@ std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
     for (const std::uint32_t position : *selection) {
       const ChannelList::Channel& channel = (*now->channels)[position];
       const auto found = before.find(channel.get());
-      // Skip a channel that appeared after the first sample: its values may include counts from
-      // before that sample.
+      // Skip a channel that appeared after the first sample, because its values may include counts
+      // from before that sample.
       if (found == before.end()) continue;
       appendDifference(*channel, found->second, valuesOf(*now, position), reading->values);
       channels.push_back(channel);

@@ -99,7 +99,7 @@ class GroupChannels final : public IOReportChannels {
 // the object.
 class GroupSubscription final : public IOReportSubscription {};
 
-// Reads the sources when the first sample is requested: a moment without samples costs nothing.
+// Reads the sources when the first sample is requested. A moment without samples costs nothing.
 class ReadMoment final : public IOReportMoment {
  public:
   ReadMoment(const Readers& readers, std::chrono::milliseconds longestWait)
@@ -160,7 +160,7 @@ std::int32_t LinuxIOReportService::IOReportGetChannelCount(const Channels& chann
 IOReportService::Subscription LinuxIOReportService::IOReportCreateSubscription(
     const Channels& channels, Channels& subscribedChannels,
     std::optional<IOReportError>& /*error*/) {
-  // A subscription allocates nothing: it refers to the channels that its set has found.
+  // A subscription allocates nothing, because it refers to the channels that its set has found.
   subscribedChannels = channels;
   return std::make_shared<GroupSubscription>();
 }

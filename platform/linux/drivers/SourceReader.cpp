@@ -33,8 +33,8 @@ SourceReader::~SourceReader() {
 
 void SourceReader::startOpening() {
   thread_ = std::thread([this] { run(); });
-  // Request the first reading before the source is open: the reading is made as soon as it has
-  // opened.
+  // Request the first reading before the source is open. The reading is made as soon as the source
+  // has opened.
   opening_ = ask(kLongestOpening, Use::kFindChannels);
 }
 
@@ -79,7 +79,7 @@ SourceReader::ReadingPointer SourceReader::receive(const Asked& asked, bool& isF
 
 // Requests a reading that begins after this call. Returns its number.
 std::uint64_t SourceReader::want() {
-  // Do not use the reading that is being made: its values may be older than the request.
+  // Do not use the reading that is being made, because its values may be older than the request.
   const std::uint64_t number = lastBegun_ + 1;
   if (lastWanted_ < number) {
     lastWanted_ = number;
@@ -128,8 +128,8 @@ void SourceReader::makeReadings() {
     if (waiting_ > 0) std::swap(handedOver_, reading);
     made_.notifyAll();
     mutex_.unlock();
-    // Release the replaced or unused reading without the lock: its destructor may call the source,
-    // which must not delay threads with requests.
+    // Release the replaced or unused reading without the lock, because its destructor may call the
+    // source, which must not delay threads with requests.
     reading.reset();
     if (isSample) source_->sampled();
     mutex_.lock();

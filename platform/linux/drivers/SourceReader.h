@@ -19,11 +19,11 @@ namespace halvox::platform::linux_ {
 //
 // The source is late after a reading that took too long, and in time again after one that did not.
 //
-// A request never gets a reading that began before it: such a reading would miss what was counted
-// in between. Requests that arrive during a reading share the next one.
+// A request never gets a reading that began before it, because such a reading would miss what was
+// counted in between. Requests that arrive during a reading share the next one.
 //
-// Any thread may use it. The service owns it; it owns the source. Its destructor waits for the
-// reading that is in progress.
+// Any thread may use it. The service owns the reader, which owns the source. Its destructor waits
+// for the reading that is in progress.
 class SourceReader {
  public:
   using Clock = std::chrono::steady_clock;
@@ -57,8 +57,8 @@ class SourceReader {
   };
   // The purpose of a reading: to find channels, or to sample them for a session.
   enum class Use : std::uint8_t { kFindChannels, kSample };
-  // Requests a reading, which may take `wait`. Does not block: several sources can read at the same
-  // time.
+  // Requests a reading, which may take `wait`. Does not block, so that several sources can read at
+  // the same time.
   [[nodiscard]] Asked ask(std::chrono::milliseconds wait, Use use);
   // Waits for the requested reading. Returns null if it does not arrive in time, and logs only the
   // first of several late readings in a row. The source is still read afterwards, but no thread

@@ -29,8 +29,8 @@ class NoKdebugService final : public KdebugService {
 // NoKdebugService.
 class LttngKdebugService final : public KdebugService {
  public:
-  // The service, or the reason why its module cannot be loaded. Call it before other
-  // threads start: it may set an environment variable, which is not thread-safe.
+  // The service, or the reason why its module cannot be loaded. Call it before other threads start,
+  // because it may set an environment variable, which is not thread-safe.
   static Result<std::unique_ptr<KdebugService>> load();
 
   void kdebug_trace(std::uint32_t code, std::uint64_t argument1, std::uint64_t argument2,

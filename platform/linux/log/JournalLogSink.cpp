@@ -79,8 +79,8 @@ bool isJournalStream(int descriptor) {
   const auto second = std::from_chars(first.ptr + 1, end, inode);
   if (second.ec != std::errc{} || second.ptr != end) return false;
   struct stat status {};
-  // Compare the file with the one that the variable names: programs also inherit the variable if
-  // their standard error is something else, such as a file.
+  // Compare the descriptor's file with the one that the variable names, because programs also
+  // inherit the variable if their standard error is something else, such as a file.
   return ::fstat(descriptor, &status) == 0 && status.st_dev == device && status.st_ino == inode;
 }
 

@@ -10,7 +10,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The longest text of a line, in bytes after escaping. Clients choose parts of lines: a message of
+// The longest text of a line, in bytes after escaping. Clients choose parts of lines. A message of
 // a megabyte must not become a line of a megabyte.
 inline constexpr std::size_t kLongestLogLine = 8192;
 
@@ -20,9 +20,8 @@ void appendLogLineText(std::string& line, const LogEntry& entry);
 
 // Formats entries as lines of text in local time, each with its end:
 //   2024-05-01T12:00:00.123+02:00 error [com.tarno.halvox:hvrs] the line
-// Local time, because readers compare the log with what users report; with the offset, because
-// files of several machines are merged.
-// Belongs to one thread.
+// The time is local, because readers compare the log with what users report. It has its offset,
+// because files of several machines are merged. Belongs to one thread.
 class LogLineFormatter {
  public:
   // Valid until the next call.

@@ -57,8 +57,8 @@ class LogMemory {
   const LogLevel level_;
   const Bounds bounds_;
   mutable Mutex mutex_;
-  // Both reserve their whole address range at the start. The kernel provides the memory only as
-  // lines arrive.
+  // `lines_` and `ring_` reserve their whole address range at the start. The kernel provides the
+  // memory only as lines arrive.
   std::vector<Line> lines_ HALVOX_GUARDED_BY(mutex_);  // a ring once it is full
   std::unique_ptr<char[]> ring_ HALVOX_GUARDED_BY(mutex_);
   std::uint64_t firstLine_ HALVOX_GUARDED_BY(mutex_) = 0;

@@ -21,7 +21,7 @@ bool LogQueue::add(LogEntry entry) {
   bool isFirst = false;
   {
     const MutexLock lock(mutex_);
-    // Drops the new line: threads that log never wait for a slow reader.
+    // Drop the new line, because threads that log never wait for a slow reader.
     if (hasEnded_ || bytes_ + cost > room) return false;
     isFirst = entries_.empty();
     entries_.push_back(std::move(entry));

@@ -76,7 +76,7 @@ LogCategory& QueuedLogService::createCategory(std::string_view subsystem,
 }
 
 void QueuedLogService::stop() {
-  // Call end() before finish(): the thread then still writes the queued lines, and finish() limits
+  // Call end() before finish(). The thread then still writes the queued lines, and finish() limits
   // its wait for a reader that does not read to one second.
   queue_.end();
   sink_->finish();

@@ -22,8 +22,8 @@ namespace halvox::platform::linux_ {
 // The log of the service. A bounded queue leads to one thread that formats and writes lines. A slow
 // reader of the log therefore never delays the threads that log. When the queue is full, lines are
 // dropped and counted; the last part of the queue is kept for errors. The log reports the loss when
-// the queue has space again. Lines can contain texts of clients: control characters are escaped,
-// and long lines are cut. The thread sleeps while nothing is logged.
+// the queue has space again. Lines can contain texts of clients. Control characters are therefore
+// escaped, and long lines are cut. The thread sleeps while nothing is logged.
 //
 // The newest lines also stay in memory, at a level of their own, for captures of diagnostics.
 //

@@ -24,10 +24,10 @@ constexpr std::size_t kChunk = 4096;
 // How long the end of the service waits for a reader that does not read.
 constexpr std::chrono::milliseconds kLastWait{1000};
 
-// Waits for its reader in poll(2) without a time-out: a stuck reader causes no wake-ups. finish()
-// wakes it through an event descriptor. The log's descriptor stays blocking, because it is shared
-// with other processes. poll() and short writes keep the thread from blocking in write(2).
-// Threads: the log's thread; finish() from any.
+// Waits for its reader in poll(2) without a time-out. A stuck reader therefore causes no wake-ups.
+// finish() wakes it through an event descriptor. The log's descriptor stays blocking, because it is
+// shared with other processes. poll() and short writes keep the thread from blocking in write(2).
+// Threads: the log's thread calls write(); any thread may call finish().
 class TextLogSink final : public LogSink {
  public:
   explicit TextLogSink(int descriptor)
@@ -76,7 +76,7 @@ bool TextLogSink::waitForReader() {
       const auto left =
           std::chrono::duration_cast<std::chrono::milliseconds>(*deadline_ - Clock::now());
       timeout = static_cast<int>(std::max<std::int64_t>(left.count(), 0));
-      // Do not poll `finish_` any more: it stays readable and would end each wait at once.
+      // Do not poll `finish_` any more, because it stays readable and would end each wait at once.
       polled[1].fd = -1;
     }
     const int ready = ::poll(polled.data(), polled.size(), timeout);

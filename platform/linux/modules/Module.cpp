@@ -43,8 +43,8 @@ Result<void*> loadModule(const Module& module, const std::filesystem::path& path
   // process at the first call.
   void* const library = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
   if (library == nullptr) return failure(lastError());
-  // Check the version before the entry point: a module of another release may have an entry point
-  // of the same name.
+  // Check the version before the entry point, because a module of another release may have an entry
+  // point of the same name.
   const auto* const version = static_cast<const char*>(::dlsym(library, kVersionSymbol));
   if (version == nullptr) return failure(path.native() + " is not a module of this service");
   if (std::string_view(version) != halvoxVersion()) {

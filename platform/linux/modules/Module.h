@@ -12,7 +12,7 @@ namespace halvox::platform::linux_ {
 struct Module {
   const char* file;  // such as "halvox-link-nats.so"
   // The function that makes the part. Its name ends with the version of its signature and of the
-  // classes that it shares with the program: raise the version whenever one of these changes.
+  // classes that it shares with the program. Raise the version whenever one of these changes.
   const char* entryPoint;
 };
 
@@ -23,8 +23,8 @@ struct Module {
 // Loads the module and returns the address of its entry point, or why it cannot be loaded. The
 // error names the module, the path and the system's reason. A module of another version of the
 // service is refused, because the classes that both share may differ. The module stays loaded until
-// the process ends: its libraries have threads, and objects of the service refer to its code.
-// Blocks on the disk. Any thread may call.
+// the process ends, because its libraries have threads, and objects of the service refer to its
+// code. Blocks on the disk. Any thread may call.
 [[nodiscard]] Result<void*> loadModule(const Module& module);
 // Loads the module from that path, in the same way.
 [[nodiscard]] Result<void*> loadModule(const Module& module, const std::filesystem::path& path);

@@ -8,8 +8,8 @@ namespace halvox::pipewire {
 
 // This program's end of one object of the server: owns the proxy and its hook. If the server
 // refuses the binding, no event arrives. Belongs to the loop's thread. Destroy it when the object
-// disappears or the connection ends, but never within one of its own events: the library still uses
-// it then.
+// disappears or the connection ends, but never within one of its own events, because the library
+// still uses it then.
 class ObjectBinding {
  public:
   ObjectBinding(pw_registry* registry, std::uint32_t id, const char* type, std::uint32_t version)

@@ -14,7 +14,7 @@ namespace halvox::pipewire {
 [[nodiscard]] bool loadProfilerModule(pw_context* context);
 
 // Follows the profiler of the server and passes on each of its events. Events arrive many times a
-// second while streams run, and wake this process: make a binding only while events are wanted.
+// second while streams run, and wake this process. Make a binding only while events are wanted.
 class ProfilerBinding {
  public:
   using ProfileHandler = std::function<void(const spa_pod* profile)>;

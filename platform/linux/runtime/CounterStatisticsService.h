@@ -20,21 +20,21 @@ struct CounterReading {
   friend bool operator==(const CounterReading&, const CounterReading&) = default;
 };
 
-// Owns the service's counters, by piece and name. They live as long as it does. Any thread may
-// call; finding a counter takes a lock, adding to one does not.
+// Owns the service's counters, by piece and name. The counters live as long as the service. Any
+// thread may call; finding a counter takes a lock, adding to one does not.
 class CounterStatisticsService final : public StatisticsService {
  public:
   Counter& counter(std::string_view piece, std::string_view name) override;
 
-  // All counters in the order of piece and name. Each is read by itself: sums agree only after the
-  // threads that count have stopped.
+  // All counters in the order of piece and name. Each is read by itself. Sums therefore agree only
+  // after the threads that count have stopped.
   [[nodiscard]] std::vector<CounterReading> snapshot() const;
 
  private:
   using CountersOfPiece = std::map<std::string, Counter, std::less<>>;
 
   mutable Mutex mutex_;
-  // A map, because its elements do not move: references to counters stay valid.
+  // A map, because its elements do not move, and references to counters must stay valid.
   std::map<std::string, CountersOfPiece, std::less<>> counters_ HALVOX_GUARDED_BY(mutex_);
 };
 

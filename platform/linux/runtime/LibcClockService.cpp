@@ -42,7 +42,7 @@ LocalTime LibcClockService::localTime(Date date) const {
   constexpr double kFarthest = 1e15;  // about 31 million years, which time_t and tm can represent
   // The condition is negated so that NaN is refused, too.
   if (!(std::abs(date.secondsSince1970) <= kFarthest)) return {};
-  // Round down and not towards zero: the two differ for dates before 1970.
+  // Round down and not towards zero, because the two differ for dates before 1970.
   const auto time = static_cast<std::time_t>(std::floor(date.secondsSince1970));
   std::tm local{};
   if (::localtime_r(&time, &local) == nullptr) return {};

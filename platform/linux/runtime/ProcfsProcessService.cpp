@@ -45,8 +45,8 @@ std::string ProcfsProcessService::ownProcessName() const {
 
 void ProcfsProcessService::terminate(int exitStatus) {
   if (beforeEnd_) beforeEnd_();
-  // exit() would be wrong: other threads still run, and the destructors of what they use would race
-  // with them.
+  // exit() would be wrong, because other threads still run, and the destructors of what they use
+  // would race with them.
   ::_exit(exitStatus);
 }
 

@@ -41,8 +41,8 @@ std::error_code DirectoryWatch::arm(std::vector<std::filesystem::path> directori
   // The descriptors of the old instance are not valid for the new one.
   watches_.clear();
   isThere_.assign(directories_.size(), false);
-  // A new instance, instead of removing watches one by one: the events of the old watches disappear
-  // with the old instance.
+  // A new instance, instead of removing watches one by one, because the events of the old watches
+  // disappear with the old instance.
   inotify_.reset(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
   if (!inotify_) return lastError();
   std::error_code first;

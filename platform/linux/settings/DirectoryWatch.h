@@ -15,7 +15,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Watches the files in some directories with inotify. A directory need not exist: the watch then
+// Watches the files in some directories with inotify. A directory need not exist. The watch then
 // waits until it appears. Uses no timer, so that an idle service causes no wake-ups.
 //
 //   made --arm()--> armed --(a directory appeared, disappeared or was moved; events were lost)-->
@@ -32,7 +32,7 @@ class DirectoryWatch {
   enum class State : unsigned char { kArmed, kMustBeArmedAgain };
 
   // Starts to watch these directories (absolute paths) instead of the previous ones. Changes
-  // between the last read() and this call are lost: compare the files afterwards. Returns the first
+  // between the last read() and this call are lost. Compare the files afterwards. Returns the first
   // error for a directory that exists but cannot be watched.
   [[nodiscard]] std::error_code arm(std::vector<std::filesystem::path> directories);
   // Returns true when the directory existed at the last arm().

@@ -230,7 +230,8 @@ void InotifyNotifyService::deliver() {
   if (!firstNews_.has_value()) return;
   if (Clock::now() < std::min(lastNews_ + kQuietTime, *firstNews_ + kLongestDelay)) return;
   firstNews_.reset();
-  // A set, because one save can change several domains of one name and must post it once.
+  // A set, because one save can change several domains of one name, and must post the name only
+  // once.
   const std::set<std::string> posted = settings_.settle();
   for (const Registration& one : registrations_) {
     if (!posted.contains(one.name)) continue;

@@ -30,7 +30,7 @@ inline constexpr NotifyStatus kNotifyFailed = 1'000'000;
 //
 // From the first registration on, a thread of its own waits for changes, without a timer. The
 // directories may be missing, and may be deleted and created again. Symbolic links on the way to a
-// preference file or to the notify directory are followed: a change of the target or of a link
+// preference file or to the notify directory are followed. A change of the target or of a link
 // counts. When the files cannot be watched, for example because of the kernel's limits, the thread
 // logs an error once and tries again every five seconds.
 //

@@ -65,8 +65,8 @@ std::optional<std::filesystem::path> preferencePath(const std::filesystem::path&
 
 Result<std::optional<PreferenceText>> readPreferenceText(const std::filesystem::path& file) {
   auto content = readText(file);
-  // Check before parsing: the parser bounds brackets but not dotted keys, and walking through the
-  // tables of a key of 100,000 words ran out of stack.
+  // Check before parsing, because the parser bounds brackets but not dotted keys, and walking
+  // through the tables of a key of 100,000 words ran out of stack.
   if (content && content->has_value() && isNestedTooDeep((*content)->text)) {
     return problem(file, ": expected at most " + std::to_string(kDeepestNesting) +
                              " levels of tables and arrays, found more");

@@ -17,7 +17,7 @@ namespace halvox::platform::linux_ {
 
 // The user whose files hold the named suites and the watched settings.
 inline constexpr std::string_view kPreferenceUser = "mobile";
-// Larger files are refused: callers on the service's queues wait while the file is read.
+// Larger files are refused, because callers on the service's queues wait while the file is read.
 inline constexpr std::size_t kLargestPreferenceFile = 1U << 20U;
 
 // The content and the permissions of a file.

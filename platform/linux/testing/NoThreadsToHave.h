@@ -6,8 +6,8 @@
 
 namespace halvox::platform::linux_ {
 
-// While it exists, no thread can be started: the default size of stacks is larger than any address
-// space.
+// While it exists, no thread can be started, because the default size of stacks is larger than any
+// address space.
 class NoThreadsToHave {
  public:
   NoThreadsToHave() {

@@ -30,8 +30,8 @@ class JsonResultsFileHarness {
     document.Parse<rapidjson::kParseFullPrecisionFlag>(text.data(), text.size());
     if (document.HasParseError()) return std::nullopt;
     ResultsFileContent content{document["product"].GetString(), document["version"].GetUint(), {}};
-    // A range-based loop does not compile: clang 14 cannot compare the iterators of this library's
-    // objects.
+    // A range-based loop does not compile, because clang 14 cannot compare the iterators of this
+    // library's objects.
     const rapidjson::Value& all = document["values"];
     for (auto member = all.MemberBegin(); !(member == all.MemberEnd()); ++member) {
       std::vector<double> values;

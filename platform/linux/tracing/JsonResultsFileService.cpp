@@ -35,8 +35,8 @@ std::pair<std::string_view, std::string> split(std::string_view path) {
   return {path.substr(0, slash + 1), std::string(path.substr(slash + 1))};
 }
 
-// Keeps the values in memory until the file is finished: the file lists them by name, but they
-// arrive in any order.
+// Keeps the values in memory until the file is finished, because the file lists them by name, but
+// they arrive in any order.
 class ResultsFile final : public Sswriter {
  public:
   ResultsFile(std::string_view product, std::uint32_t version)

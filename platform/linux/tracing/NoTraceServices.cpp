@@ -44,8 +44,8 @@ class NoKtraceService final : public KtraceService {
   int ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) override {
     const auto ours = own(session, State::kMade);
     if (ours == nullptr || queue == nullptr) return kNoTracer;
-    // The trace counts as started although this returns an error: the caller ends it and waits for
-    // the completion.
+    // The trace counts as started although this returns an error, because the caller ends it and
+    // waits for the completion.
     ours->state = State::kStarted;
     ours->queue = std::move(queue);
     return kNoTracer;
@@ -55,7 +55,8 @@ class NoKtraceService final : public KtraceService {
     if (ours == nullptr) return;
     ours->state = State::kEnded;
     ours->queue->async(JobWeight::kMayBlock, [ours] {
-      // Move the handler out first: it may destroy the session, which would destroy the handler.
+      // Move the handler out first, because it may destroy the session, which would destroy the
+      // handler.
       if (const auto completion = std::exchange(ours->completion, nullptr)) completion();
     });
   }

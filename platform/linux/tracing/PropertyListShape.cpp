@@ -34,11 +34,11 @@ bool hasNulInXml(std::string_view text) {
 
 // Counts the tags of an XML list and compares them with the bounds.
 //
-// This is not an XML parser, and must not be: it only has to count at least as much as the library
-// will. Anything that the library might read differently is refused, or counted in the way that
-// reaches the bounds sooner. Opening tags inside comments count, closing ones do not; quotes in
-// tags must be balanced and contain no bracket; the document type must not have declarations of its
-// own.
+// This is not an XML parser and need not be one, because it only has to count at least as much as
+// the library will. Anything that the library might read differently is refused, or counted in the
+// way that reaches the bounds sooner. Opening tags inside comments count, closing ones do not;
+// quotes in tags must be balanced and contain no bracket; the document type must not have
+// declarations of its own.
 class XmlShape {
  public:
   XmlShape(std::string_view text, const PropertyListBounds& bounds)
@@ -253,7 +253,8 @@ class BinaryShape {
     return true;
   }
 
-  // Most significant byte first. The caller has checked that the bytes exist.
+  // Reads a number whose most significant byte comes first. The caller has checked that the bytes
+  // exist.
   [[nodiscard]] std::uint64_t number(std::size_t at, std::size_t size) const {
     std::uint64_t result = 0;
     for (const char byte : bytes_.substr(at, size)) {

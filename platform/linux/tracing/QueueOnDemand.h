@@ -7,9 +7,9 @@
 
 namespace halvox::platform::linux_ {
 
-// A serial queue that is made when it is first needed: most runs of the service record no trace,
-// and need neither its queue nor its thread.
-// Threads: any may call; nothing blocks. Owner: the service that works on the queue.
+// A serial queue that is made when it is first needed, because most runs of the service record no
+// trace, and need neither its queue nor its thread. Threads: any may call; nothing blocks. Owner:
+// the service that works on the queue.
 class QueueOnDemand {
  public:
   struct Options {

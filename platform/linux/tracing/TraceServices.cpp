@@ -11,8 +11,8 @@ namespace halvox::platform::linux_ {
 std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options, LogService& log,
                                                  StatisticsService& statistics) {
   const std::filesystem::path directory = options.storageDirectory / "traces";
-  // Load the module also for leftovers: a recording of an earlier run fills the disk until its
-  // session is destroyed, and only the module can destroy it.
+  // Load the module also for leftovers, because a recording of an earlier run fills the disk until
+  // its session is destroyed, and only the module can destroy it.
   if (options.tracing == Tracing::kDisabled && !hasTraceLeftovers(directory)) {
     return makeNoTraceServices("features.Acoustat.Tracing is not true");
   }

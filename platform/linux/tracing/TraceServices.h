@@ -29,7 +29,7 @@ class TraceServices {
   // Removes what an earlier service with the same storage directory did not remove. Waits for the
   // tracer only if something remains.
   virtual void open() = 0;
-  // Lets running traces end soon: after this call, nothing waits for a queue. Call it before the
+  // Lets running traces end soon. After this call, nothing waits for a queue. Call it before the
   // queues end.
   virtual void stop() = 0;
   // Removes everything that this service made in the tracer. Call it after the queues have ended.
@@ -51,8 +51,8 @@ struct TraceOptions {
 // Returns services that record with LTTng. Loads halvox-tracing-lttng.so for them, and with it
 // LTTng's control library and babeltrace2. Returns services whose traces cannot be started, and
 // whose description says why, when tracing is disabled or the module cannot be loaded. The module
-// is also loaded when an earlier service did not remove a recording, because only the module can.
-// The log and the statistics must outlive the services.
+// is also loaded when an earlier service did not remove a recording, because only the module can
+// remove it. The log and the statistics must outlive the services.
 [[nodiscard]] std::unique_ptr<TraceServices> makeTraceServices(const TraceOptions& options,
                                                                LogService& log,
                                                                StatisticsService& statistics);

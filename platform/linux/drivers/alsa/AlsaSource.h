@@ -23,7 +23,7 @@ namespace halvox::platform::linux_ {
 // The driver is the card's name. If several cards have the same name, the later ones are reported
 // as "name <card number>". If a PCM has several substreams, all but the first have their number in
 // the channel's name. What is missing, or disappears while it is read, is skipped without a log
-// line: cards come and go.
+// line, because cards come and go.
 //
 // Its SourceReader owns it and calls it on one thread.
 class AlsaSource final : public DriverSource {

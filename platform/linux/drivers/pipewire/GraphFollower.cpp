@@ -138,17 +138,17 @@ void GraphFollower::proceed() {
     }
     return;
   }
-  // Try once even if no session needs the server: the service looks for channels at its start, when
-  // no session runs yet.
+  // Try once even if no session needs the server, because the service looks for channels at its
+  // start, when no session runs yet.
   if (!server_.isConnected() && (isWanted || !isTried_)) lookForServer();
-  // Stop watching: nothing may wake this thread while no session runs or while the server is
-  // connected.
+  // Stop watching, because nothing may wake this thread while no session runs or while the server
+  // is connected.
   if (server_.isConnected() || !isWanted) watch_.end();
   updateProfiler(isWanted);
 }
 
 void GraphFollower::lookForServer() {
-  // Watch before the attempt: a socket that appears after the attempt must be noticed.
+  // Watch before the attempt, because a socket that appears after the attempt must be noticed.
   watch_.begin();
   if (attempts_ == 0) return;
   --attempts_;

@@ -22,8 +22,8 @@ namespace halvox::platform::linux_ {
 //   waiting --a connection succeeds--> following --the connection ends--> waiting
 //
 // Threads: everything runs on the loop's thread, except construction and destruction, which happen
-// while that thread does not run. PipeWireDriverSource owns it; it borrows the loop and the graph.
-// Failure: a server that is missing or disconnects is not an error. The comment of
+// while that thread does not run. PipeWireDriverSource owns the follower, which borrows the loop
+// and the graph. Failure: a server that is missing or disconnects is not an error. The comment of
 // PipeWireDriverSource says when a server is searched for.
 class GraphFollower final : private pipewire::ServerListener {
  public:

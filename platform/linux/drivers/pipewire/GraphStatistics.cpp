@@ -43,8 +43,8 @@ GraphStatistics::GraphStatistics()
           makeChannel(describeNodeChannel(kSourceGroup, "pipewire", "connections"))} {}
 
 void GraphStatistics::serverLost(Time now) {
-  // Keep the statistics: this process has made the counts itself, and continues them after the
-  // server has restarted.
+  // Keep the statistics, because this process has made the counts itself, and continues them after
+  // the server has restarted.
   for (auto& [id, node] : nodes_) keep(std::move(node), now);
   nodes_.clear();
   drivers_.clear();

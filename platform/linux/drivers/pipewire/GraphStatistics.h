@@ -24,14 +24,14 @@ namespace halvox::platform::linux_ {
 // lose what was counted before. Counts can continue on another server because they are made here
 // and not by the server.
 //
-// It uses neither PipeWire nor a clock, and its tests need neither: the caller passes events and
-// times. Not thread-safe; SharedGraph owns and guards it. Cannot fail.
+// This class uses neither PipeWire nor a clock, and its tests need neither, because the caller
+// passes events and times. Not thread-safe; SharedGraph owns and guards it. Cannot fail.
 class GraphStatistics {
  public:
   using Time = NodeStatistics::Time;
   using NodeID = std::uint32_t;
 
-  // Further sinks and sources are ignored: any client can create nodes.
+  // Further sinks and sources are ignored, because any client can create nodes.
   static constexpr std::size_t kMostNodes = 256;
   static constexpr std::size_t kLongestName = 128;  // bytes; longer names are cut
 
@@ -44,8 +44,8 @@ class GraphStatistics {
   void profilingBegan();
 
   // Returns false if the node is neither sink nor source, or if there are kMostNodes already. The
-  // caller then need not pass its later events. If the key of a report would be equal for two
-  // nodes, the later one is called "name#id".
+  // caller then need not pass its later events. If two nodes would have the same key in a report,
+  // the later one is called "name#id".
   bool nodeAdded(NodeID id, std::string_view mediaClass, std::string_view name);
   void nodeRemoved(NodeID id, Time now);
   void nodeStateChanged(NodeID id, std::optional<NodeState> state, Time now);
@@ -69,8 +69,8 @@ class GraphStatistics {
   std::array<ChannelList::Channel, 2> connectionsChannels_;
   std::uint64_t connections_ = 0;
   std::map<NodeID, std::unique_ptr<NodeStatistics>> nodes_;
-  // The statistics of nodes that have disappeared, the latest last. At most kMostNodes; the oldest
-  // is removed.
+  // The statistics of nodes that have disappeared, the latest last. At most kMostNodes. If there
+  // are more, the oldest one is removed.
   std::deque<std::unique_ptr<NodeStatistics>> gone_;
   std::map<NodeID, Driver> drivers_;  // including nodes that are neither sink nor source
 };

@@ -57,7 +57,7 @@ class PipeWireDriverSource::Impl {
     pw_init(nullptr, nullptr);
   }
   ~Impl() {
-    // Do this first: leases may outlive this object and must not wake a loop that ends.
+    // Do this first, because leases may outlive this object and must not wake a loop that ends.
     bell_->remove();
     if (loop_ != nullptr) pw_thread_loop_stop(loop_);
     // Destroy the follower after the thread has stopped, because the connection's objects belong to

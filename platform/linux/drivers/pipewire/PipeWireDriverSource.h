@@ -13,12 +13,12 @@ namespace halvox::platform::linux_ {
 //
 // Threads: the library has a thread that follows the server. It sleeps until the server sends an
 // event. While no reading is held, events come only when nodes appear, disappear or change their
-// state. The profiler, which reports each cycle, is bound only while a reading is held: an idle
-// service must not wake up for every cycle. Cycles are therefore counted only from the first held
-// reading on, while any is held. Owner: its SourceReader, which calls it on one thread. Failure:
-// without a server there are only the channels "connections", which count how often the server was
-// reached. The source looks for the server when the first reading is held, and connects as soon as
-// its socket appears while a reading is held. Nothing wakes up meanwhile.
+// state. The profiler, which reports each cycle, is bound only while a reading is held, because an
+// idle service must not wake up for every cycle. Cycles are therefore counted only from the first
+// held reading on, while any is held. Owner: its SourceReader, which calls it on one thread.
+// Failure: without a server there are only the channels "connections", which count how often the
+// server was reached. The source looks for the server when the first reading is held, and connects
+// as soon as its socket appears while a reading is held. No thread wakes up until then.
 class PipeWireDriverSource final : public DriverSource {
  public:
   struct Options {

@@ -15,7 +15,7 @@ namespace halvox::platform::linux_ {
 // socket.
 //
 // The environment at construction decides where the socket is, by the library's own rules. This
-// class watches only between begin() and end(). It uses inotify instead of a timer: waiting for a
+// class watches only between begin() and end(). It uses inotify instead of a timer. Waiting for a
 // server then costs nothing. Belongs to the loop's thread, or to a caller that knows that this
 // thread does not run. GraphFollower owns it. Without the directory, or without inotify, it never
 // calls back.

@@ -14,7 +14,7 @@ namespace {
 constexpr std::size_t kMostStates = 64;
 constexpr std::size_t kMostBuckets = 256;
 
-// Thrown and caught in this file only: the metrics contradict themselves.
+// Thrown if the metrics contradict each other, and caught in this file.
 struct Contradiction {
   MetricError error;
 };
@@ -78,7 +78,8 @@ ChannelDescription describe(const MetricFamily& family, const MetricLabels& labe
   return channel;
 }
 
-// OpenMetrics lets a counter and a histogram have a sample with the time of their creation.
+// True for the sample with the time of creation, which OpenMetrics allows for a counter and a
+// histogram.
 bool isCreationTime(const MetricSample& sample) { return sample.suffix == "_created"; }
 
 // Makes the channels of one text. Used once.

@@ -186,7 +186,7 @@ std::string threeMetrics(const std::string& type, const std::string& counters) {
   return states + residency + transitions;
 }
 
-// The CPU time of this thread: other work on the machine does not count.
+// The CPU time of this thread, which other work on the machine does not change.
 double secondsToRead(const std::string& text) {
   const auto now = [] {
     timespec time{};

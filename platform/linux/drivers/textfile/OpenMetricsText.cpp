@@ -14,7 +14,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// Thrown and caught in this file only: the current line has an error.
+// Thrown if the current line has an error, and caught in this file.
 struct Mistake {
   std::string what;
 };
@@ -118,7 +118,7 @@ MetricLabels parseLabels(LineCursor& line) {
     if (!line.skip(',') && !line.startsWith('}')) throw Mistake{"expected , or } after the label"};
     line.skipBlanks();
   }
-  // Sort the labels: the same labels in another order name the same series.
+  // Sort the labels, because the same labels in another order name the same series.
   std::ranges::sort(labels);
   const auto twice = std::ranges::adjacent_find(labels, {}, &MetricLabel::name);
   if (twice != labels.end()) throw Mistake{"the label " + twice->name + " appears twice"};
@@ -157,7 +157,8 @@ std::optional<MetricType> typeNamed(std::string_view name) {
   return found->second;
 }
 
-// Parses one text. Used once. Stops at the first error: a file that has one is not used at all.
+// Parses one text. Used once. Stops at the first error, because a file that has one is not used at
+// all.
 class Parser {
  public:
   std::variant<OpenMetricsText::Families, MetricError> parse(std::string_view text) {
@@ -252,7 +253,7 @@ class Parser {
     line.skipBlanks();
     sample.number = parseNumber(line.takeUntilBlank());
     line.skipBlanks();
-    // A time stamp. It is not used, because counters are sampled now.
+    // Skip a time stamp, because counters are sampled now.
     if (!line.isAtEnd() && !line.startsWith('#'))
       static_cast<void>(parseNumber(line.takeUntilBlank()));
     line.skipBlanks();

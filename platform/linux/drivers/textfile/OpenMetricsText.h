@@ -66,7 +66,7 @@ struct MetricError {
 // Parses metrics in the OpenMetrics text format, or in the older format of exporters' text files,
 // which has no "# EOF".
 //
-// Any program may write these files, and their content is not trusted: whatever the format does not
+// Any program may write these files, and their content is not trusted. Whatever the format does not
 // allow is an error, and all sizes are bounded. The bounds are far above real files. They keep one
 // file from using up the service's memory or the 50 ms that a reading may take. Pure functions; any
 // thread may call them.

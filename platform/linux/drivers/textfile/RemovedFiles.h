@@ -13,7 +13,7 @@ namespace halvox::platform::linux_ {
 // Finds out which files were deleted from a directory since the last call, even if files with the
 // same names exist again. Renaming a file over another one updates that one and does not delete it.
 //
-// It uses inotify, but no thread waits for it: the kernel keeps the names until the next call. An
+// It uses inotify, but no thread waits for it. The kernel keeps the names until the next call. An
 // idle service therefore does not wake up. Belongs to one thread; the source owns it.
 //
 // Without the directory it reports nothing, and watches the directory once it exists. Without

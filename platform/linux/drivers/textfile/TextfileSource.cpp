@@ -52,7 +52,7 @@ std::string reasonOf(const FileContent& file) {
 
 std::shared_ptr<const Reading> TextfileSource::read() {
   ++round_;
-  // A limit for all files together: with fifty large files, each within its own limit, the service
+  // A limit for all files together. With fifty large files, each within its own limit, the service
   // used half a gigabyte.
   std::size_t room = kMostBytes;
   // Do this before listing the files. A file that is deleted later is noticed at the next reading.

@@ -24,7 +24,7 @@ namespace halvox::platform::linux_ {
 // A file that has an error, is too large or is not a regular file is skipped as a whole, and logged
 // once for each change of the file. Files beyond the total size are treated in the same way. If two
 // files have the same channel, the one that sorts first by name is used. A file that is deleted
-// takes its channels with it: a later file of the same name has new channels.
+// takes its channels with it. A later file of the same name has new channels.
 //
 // A file that has not changed is not read again; its size and times are compared. Its SourceReader
 // owns the source and calls it on one thread.

@@ -24,7 +24,7 @@ constexpr const char* kPulses = "# TYPE pulses counter\npulses_total{group=\"Hap
 
 class TextfileSourceTest : public ::testing::Test {
  protected:
-  // Writes as a daemon should: the file appears complete or not at all.
+  // Writes the file as a daemon should, so that it appears complete or not at all.
   void write(const std::string& name, const std::string& text) {
     const auto file = directory_.path() / name;
     std::ofstream(file.string() + ".new") << text;

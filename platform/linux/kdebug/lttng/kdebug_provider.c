@@ -1,5 +1,5 @@
-// The tracepoint provider as a module of its own: loading LTTng starts its listener threads, and
-// the service decides whether to do so.
+// The tracepoint provider as a module of its own, because loading LTTng starts its listener
+// threads, and the service decides whether to do so.
 
 #define LTTNG_UST_TRACEPOINT_CREATE_PROBES
 #define LTTNG_UST_TRACEPOINT_DEFINE

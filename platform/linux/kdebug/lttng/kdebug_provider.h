@@ -11,7 +11,7 @@
 #include <lttng/tracepoint.h>
 #include <stdint.h>
 
-// Each line has one field; the formatter would join the lines.
+// Each line has one field. The formatter is disabled here, because it would join the lines.
 /* clang-format off */
 LTTNG_UST_TRACEPOINT_EVENT(
     halvox, kdebug,

@@ -45,7 +45,7 @@ bool DaemonProcess::write(const std::filesystem::path& noteFile) const {
 bool DaemonProcess::isAlive() const { return !startTime.empty() && startTimeOf(pid) == startTime; }
 
 void DaemonProcess::end(std::chrono::milliseconds within) const {
-  // SIGTERM first: the daemon then ends its consumer and removes its sockets.
+  // Send SIGTERM first, so that the daemon can end its consumer and remove its sockets.
   for (const int signal : {SIGTERM, SIGKILL}) {
     if (isAlive()) ::kill(pid, signal);
     const auto deadline = std::chrono::steady_clock::now() + within;

@@ -208,7 +208,7 @@ int main(int count, char** arguments) {
   if (count > 1 && std::string_view(arguments[1]) == "--emit") return emitAll(count, arguments);
   testing::InitGoogleTest(&count, arguments);
   giveUpRoot();
-  // Wait for the tracer before emitting: events that it does not listen to yet are lost.
+  // Wait for the tracer before emitting, because events that it does not listen to yet are lost.
   ::setenv("LTTNG_UST_REGISTER_TIMEOUT", "10000", 1);
   if (!hasProgram("lttng-sessiond")) {
     std::puts("skipped: there is no lttng-sessiond");

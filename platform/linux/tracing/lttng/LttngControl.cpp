@@ -116,10 +116,10 @@ void LttngControl::removeLeftovers() {
   const MutexLock lock(mutex_);
   std::error_code ignored;
   const bool isRecorded = std::filesystem::exists(scratchDirectory_, ignored);
-  // Do not call the tracer's library if nothing was left, as at most starts: a call connects to a
+  // Usually nothing was left. Do not call the tracer's library then, because a call connects to a
   // daemon, which may hang.
   if (!isRecorded && !daemon_.isNoted()) return;
-  // Adopt the daemon before destroying the sessions: if an earlier run of this service started it,
+  // Adopt the daemon before destroying the sessions. If an earlier run of this service started it,
   // it needs a keeper again.
   daemon_.adopt(namePrefix());
   if (::lttng_session_daemon_alive() == 1) destroyTracerSessions(namePrefix());
@@ -151,8 +151,8 @@ Result<void> LttngControl::setUp(const RecordingPlan& plan, const Recording& rec
   if (error) {
     return Failure<>{"cannot create " + recording.directory.string() + ": " + error.message()};
   }
-  // Check at each recording: the daemon may be one that others started, and may have ended since
-  // the last trace.
+  // Check at each recording, because the daemon may be one that others started, and may have ended
+  // since the last trace.
   if (::lttng_session_daemon_alive() != 1) {
     if (auto started = daemon_.start(namePrefix()); !started) return started;
   }

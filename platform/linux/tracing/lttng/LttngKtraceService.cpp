@@ -157,12 +157,13 @@ int LttngKtraceService::ktrace_events_range(const Session& session, std::uint32_
 int LttngKtraceService::ktrace_start(const Session& session, std::shared_ptr<DispatchQueue> queue) {
   const auto ours = own(session, State::kMade);
   if (ours == nullptr || queue == nullptr) return kUnsuitable;
-  // The trace counts as started even if the recording fails: the caller ends it and waits for its
-  // completion.
+  // The trace counts as started even if the recording fails, because the caller ends it and waits
+  // for its completion.
   ours->state = State::kStarted;
   ours->queue = std::move(queue);
   started_.add();
-  // Do not start LTTng for a session without ranges: with an empty filter, it records every event.
+  // Do not start LTTng for a session without ranges, because with an empty filter, it records every
+  // event.
   if (ours->ranges.empty()) return 0;
   auto begun = control_.begin({.event = "halvox:kdebug", .filter = ours->filter()});
   if (!begun) {
@@ -197,7 +198,8 @@ void LttngKtraceService::finish(const std::shared_ptr<LttngKtraceSession>& sessi
   }
   // Add the completion to the same queue after all batches, so that it comes after the last event.
   session->queue->async(JobWeight::kMayBlock, [session] {
-    // Move the handler out first: it may destroy the session, which would destroy the handler.
+    // Move the handler out first, because it may destroy the session, which would destroy the
+    // handler.
     if (const auto completion = std::exchange(session->completion, nullptr)) completion();
   });
 }

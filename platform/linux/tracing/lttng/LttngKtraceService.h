@@ -87,7 +87,8 @@ class LttngKtraceService final : public KtraceService {
   Counter& lost_;
   Counter& lostPackets_;
   DeliveryGate gate_{kBatchesAhead};
-  // A lower quality of service would be wrong: a stop on the reporting queue waits for this queue.
+  // A lower quality of service would be wrong, because a stop on the reporting queue waits for this
+  // queue.
   QueueOnDemand readingQueue_{
       {"Trace Reading", QualityOfService::kUserInteractive, QueueThreading::kOwnThread}};
 };

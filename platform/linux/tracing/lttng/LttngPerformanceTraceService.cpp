@@ -93,8 +93,8 @@ struct LttngPerformanceTraceService::Work {
     const std::filesystem::path archive = control.tracesDirectory() / name;
     const auto packed = packDirectory(recording.directory, archive);
     if (!packed) return traceError("cannot save the trace: " + packed.error().message);
-    // Delete old traces only after the new archive is complete: a failure must not cost an old
-    // trace.
+    // Delete old traces only after the new archive is complete, because a failure must not cost an
+    // old trace.
     removeOldTraces(control.tracesDirectory());
     url = "file://" + archive.string();
     return std::nullopt;
@@ -115,7 +115,7 @@ class LttngTraceSession final : public KQTraceSession,
   LttngTraceSession& operator=(const LttngTraceSession&) = delete;
   ~LttngTraceSession() override {
     if (!recording_.has_value()) return;
-    // The session is no longer used: end the recording and delete it without calling the delegate.
+    // The session is no longer used. End the recording and delete it without calling the delegate.
     // Do so on the queue, because ending a recording waits for the tracer.
     queue_->async(JobWeight::kMayBlock, [work = work_, recording = std::move(*recording_)] {
       work->givenUp.add();

@@ -38,7 +38,8 @@ class LttngPerformanceTraceService final : public PerformanceTraceService {
 
  private:
   const std::shared_ptr<Work> work_;  // shared with the sessions
-  // A lower quality of service would be wrong: a stop on the reporting queue waits for this queue.
+  // A lower quality of service would be wrong, because a stop on the reporting queue waits for this
+  // queue.
   QueueOnDemand queue_{
       {"Performance Trace", QualityOfService::kUserInteractive, QueueThreading::kOwnThread}};
 };

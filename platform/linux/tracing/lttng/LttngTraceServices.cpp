@@ -19,7 +19,7 @@ class LttngTraceServices final : public TraceServices {
   PerformanceTraceService& performanceTraces() override { return performanceTraces_; }
   void open() override { control_.removeLeftovers(); }
   void stop() override { ktrace_.stop(); }
-  // End sessions and daemon first: nothing can use them any more, because the queues have ended.
+  // End sessions and daemon first. Nothing can use them any more, because the queues have ended.
   void close() override {
     control_.close();
     ktrace_.close();

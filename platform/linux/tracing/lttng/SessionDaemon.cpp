@@ -9,7 +9,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The polling interval: the library has no call that waits for the daemon.
+// The polling interval. The library has no call that waits for the daemon.
 constexpr std::chrono::milliseconds kLookEvery{10};
 
 }  // namespace
@@ -25,8 +25,8 @@ void SessionDaemon::adopt(const std::string& ownSessions) {
   TracerKeeper::awaitEarlier(noteFile_, keeperEndsWithin());
   ownSessions_ = ownSessions;
   auto noted = DaemonProcess::read(noteFile_);
-  // The start time is compared, too: after a restart of the machine, the ID may be that of another
-  // process.
+  // The start time is compared, too, because after a restart of the machine, the ID may be that of
+  // another process.
   if (!noted || !noted->isAlive()) return forget();
   process_ = std::move(noted);
   // If there is no keeper now, leave() tries again to start one.

@@ -37,8 +37,8 @@ bool hideRootsDaemon() {
   return isHidden;
 }
 
-// Tests with scripts instead of the daemon. PATH contains only their directory: the tests never
-// start a tracer.
+// Tests with scripts instead of the daemon. PATH contains only their directory, so that the tests
+// never start a tracer.
 class SessionDaemonTest : public testing::Test {
  protected:
   void SetUp() override {

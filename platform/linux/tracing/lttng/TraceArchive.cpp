@@ -100,7 +100,8 @@ Result<void> packDirectory(const std::filesystem::path& directory,
   const UniqueFd file(::open(unfinished.c_str(), kFlags, kArchivePermissions));
   if (!file) return systemFailure(unfinished);
   Result<void> done = write(directory, file.get());
-  // Sync before the rename: after a power cut, an archive that has its name must have its content.
+  // Sync before the rename, because after a power cut, an archive that has its name must have its
+  // content.
   if (done && ::fsync(file.get()) != 0) done = systemFailure(unfinished);
   if (done && ::rename(unfinished.c_str(), archive.c_str()) != 0) done = systemFailure(archive);
   if (!done) ::unlink(unfinished.c_str());

@@ -22,7 +22,7 @@ class TraceArchiveTest : public testing::Test {
   TraceArchiveTest() {
     fs::create_directories(directory_);
     fs::create_directories(archives_);
-    // Random digits compress little: the archive does not fit where a test limits its size.
+    // Random digits compress little, so that the archive exceeds the limit that a test sets.
     std::ofstream file(directory_ / "stream");
     std::mt19937_64 random(1);
     for (int word = 0; word < 100'000; ++word) file << random();

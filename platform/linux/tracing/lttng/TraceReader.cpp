@@ -69,16 +69,16 @@ class Sink {
     return BT_GRAPH_SIMPLE_SINK_COMPONENT_INITIALIZE_FUNC_STATUS_OK;
   }
 
-  // noexcept: the library is C and an exception must not cross it. Only a lack of memory could
-  // cause one.
+  // noexcept, because the library is C and an exception must not cross it. Only a lack of memory
+  // could cause one.
   static bt_graph_simple_sink_component_consume_func_status consume(bt_message_iterator* iterator,
                                                                     void* sink) noexcept {
     using Status = bt_graph_simple_sink_component_consume_func_status;
     bt_message_array_const messages = nullptr;
     std::uint64_t count = 0;
     const auto status = bt_message_iterator_next(iterator, &messages, &count);
-    // The cast is valid: babeltrace defines the statuses of an iterator and of a sink with the same
-    // numbers.
+    // The cast is valid, because babeltrace defines the statuses of an iterator and of a sink with
+    // the same numbers.
     if (status != BT_MESSAGE_ITERATOR_NEXT_STATUS_OK) return static_cast<Status>(status);
     auto& self = *static_cast<Sink*>(sink);
     for (std::uint64_t index = 0; index < count; ++index) {
@@ -191,7 +191,7 @@ class TraceGraph {
     const auto* const filter =
         bt_plugin_borrow_filter_component_class_by_name_const(utils_.get(), "muxer");
     if (filter == nullptr) return false;
-    // Set the log level to none: by default the library writes to standard error.
+    // Set the log level to none, because by default the library writes to standard error.
     if (bt_graph_add_filter_component(graph_.get(), filter, "muxer", nullptr, BT_LOGGING_LEVEL_NONE,
                                       &muxer_) != BT_GRAPH_ADD_COMPONENT_STATUS_OK) {
       return false;
@@ -268,7 +268,8 @@ class TraceGraph {
 
 }  // namespace
 
-// Calculates in integers where possible: a double has 53 bits, and nanoseconds since 1970 need 61.
+// Calculates in integers where possible, because a double has 53 bits, and nanoseconds since 1970
+// need 61.
 std::uint64_t TraceClock::toNanoseconds(std::uint64_t ticks) const {
   const std::uint64_t sum = ticks + offsetTicks;
   const std::uint64_t seconds = sum / ticksPerSecond + static_cast<std::uint64_t>(offsetSeconds);

@@ -32,7 +32,7 @@ std::string keeperPath() {
 }
 
 // Reads one line, without its end. Empty if it does not arrive in time or the writer has closed the
-// pipe. Reads byte by byte: the line is short, and nothing after it may be consumed.
+// pipe. Reads byte by byte, because the line is short, and nothing after it may be consumed.
 std::string readLine(int descriptor, milliseconds within) {
   const auto deadline = steady_clock::now() + within;
   std::string line;
@@ -62,8 +62,8 @@ Result<DaemonProcess> TracerKeeper::launch(const Ward& ward, DaemonProcess daemo
   if (!life) return Failure<>{failed + life.error().message};
   auto answer = makePipe();
   if (!answer) return Failure<>{failed + answer.error().message};
-  // The keeper runs in a session of its own: a Ctrl-C in the service's terminal must not end the
-  // keeper before the traces are read.
+  // The keeper runs in a session of its own, because a Ctrl-C in the service's terminal must not
+  // end the keeper before the traces are read.
   ChildProgram program{.command = {path, ward.noteFile.string(), ward.ownSessions},
                        .descriptors = {{.number = STDIN_FILENO, .ours = life->reader.get()},
                                        {.number = STDOUT_FILENO, .ours = answer->writer.get()},

@@ -17,9 +17,9 @@ namespace halvox::platform::linux_ {
 //
 //   none --start() or keep()--> keeping --release()--> none
 //
-// However the service ends, the kernel closes its end of a pipe, and the keeper sees that. It then
-// destroys the service's sessions and ends the daemon unless others have sessions in it.
-// PR_SET_PDEATHSIG would be simpler, but it depends on the thread that forked and cannot ask
+// However the service ends, the kernel closes its end of a pipe, and the keeper sees that. The
+// keeper then destroys the service's sessions and ends the daemon unless others have sessions in
+// it. PR_SET_PDEATHSIG would be simpler, but it depends on the thread that forked and cannot ask
 // whether others use the daemon.
 //
 // The note file names the daemon, and its keeper holds a lock on the file. Belongs to one thread at

@@ -69,8 +69,8 @@ void awaitEndOfService() {
 }
 
 Result<DaemonProcess> startDaemon() {
-  // Runs in a session of its own, like the keeper: Ctrl-C in a terminal must not end the daemon
-  // before its traces are read.
+  // Runs in a session of its own, like the keeper, because Ctrl-C in a terminal must not end the
+  // daemon before its traces are read.
   auto started = ChildProcess::start({.command = {"lttng-sessiond", "--no-kernel"},
                                       .descriptors = {{.number = STDIN_FILENO},
                                                       {.number = STDOUT_FILENO},
@@ -108,8 +108,8 @@ int keep(const std::filesystem::path& noteFile, std::string_view ownSessions,
     say(daemon.error().message);
     return EXIT_FAILURE;
   }
-  // Errors are ignored: the note is needed only by a service that starts after this keeper was
-  // killed.
+  // Errors are ignored, because the note is needed only by a service that starts after this keeper
+  // was killed.
   static_cast<void>(daemon->write(noteFile));
   // Answer only after the note is written. If the service is then killed, the next one still finds
   // the daemon.
