@@ -10,6 +10,7 @@
 #include <unistd.h>
 
 #include "platform/linux/files/FileError.h"
+#include "platform/linux/files/UnnamedFile.h"
 
 namespace halvox::platform::linux_ {
 namespace {
@@ -44,14 +45,6 @@ int readAll(int file, std::span<std::byte> bytes, std::uint64_t offset) {
     offset += static_cast<std::uint64_t>(count);
   }
   return 0;
-}
-
-// Creates a file with a name and removes the name. For file systems without O_TMPFILE.
-int createUnnamed(const std::filesystem::path& directory, UniqueFd& file) {
-  std::string name = (directory / ".halvox-overflow-XXXXXX").string();
-  file.reset(::mkostemp(name.data(), O_CLOEXEC));
-  if (!file) return errno;
-  return ::unlink(name.c_str()) == 0 ? 0 : errno;
 }
 
 }  // namespace
@@ -97,7 +90,7 @@ int FileOverflowService::createFile() {
   file_.reset(::open(options_.directory.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, kPermissions));
   if (file_) return 0;
   const bool isUnknown = errno == EOPNOTSUPP || errno == EISDIR || errno == EINVAL;
-  return isUnknown ? createUnnamed(options_.directory, file_) : errno;
+  return isUnknown ? createUnnamedFile(options_.directory, file_) : errno;
 }
 
 std::optional<Error> FileOverflowService::read(OverflowPlace place, std::span<std::byte> bytes) {
