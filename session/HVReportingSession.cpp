@@ -27,7 +27,7 @@ HVReportingSession::HVReportingSession(ReporterID reporterID, ProcessIdentifiers
                                        Counters counters)
     : counters_(std::move(counters)),
       profile_(reporterID, std::move(processIdentifiers), held_),
-      history_(held_),
+      history_(reporterID, held_),
       link_(profile_, held_, *counters_),
       tracing_(profile_),
       summary_(profile_, history_) {

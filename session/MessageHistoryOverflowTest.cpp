@@ -1,6 +1,7 @@
 // What a history does when it takes much memory.
 
 #include <algorithm>
+#include <chrono>
 #include <map>
 #include <memory>
 #include <string>
@@ -19,6 +20,7 @@ namespace {
 
 using platform::Dictionary;
 using ::testing::HasSubstr;
+using namespace std::chrono_literals;
 using Outcome = SessionHistory::Outcome;
 
 constexpr auto kPlayback = AudioEventCategory::kPlayback;
@@ -58,7 +60,7 @@ class MessageHistoryOverflowTest : public testing::Test {
   platform::FakePlatform platform_;
   const std::shared_ptr<ResourceAccount> account_ = std::make_shared<ResourceAccount>();
   ResourceTally held_;
-  SessionHistory history_{held_};
+  SessionHistory history_{ReporterID{7}, held_};
   std::map<SessionHistory::Outcome, std::size_t> outcomes_;
 };
 
@@ -149,6 +151,50 @@ TEST_F(MessageHistoryOverflowTest, AFullDiskCostsTheHistoryMessagesAndNothingEls
   EXPECT_LE(account_->use().bytes, 3 * kMiB / 2);
   ASSERT_EQ(errors().size(), 1U);
   EXPECT_THAT(errors()[0], HasSubstr("cannot write: disk full"));
+  EXPECT_THAT(errors()[0], HasSubstr("the history of reporter 7 "));
+}
+
+TEST_F(MessageHistoryOverflowTest, AFullDiskIsTriedFourTimesASecond) {
+  history_.begin();
+  platform_.overflow.setWriteError(platform::Error{.description = "disk full"});
+  for (int number = 0; number < 5000; ++number) {
+    record(number, number + 1);
+    platform_.clock.advance(1ms);
+  }
+
+  // Nothing fails in the first second: a thousand messages of 1,000 bytes fit into memory.
+  EXPECT_GE(platform_.overflow.failedWrites(), 15U);
+  EXPECT_LE(platform_.overflow.failedWrites(), 16U);
+}
+
+TEST_F(MessageHistoryOverflowTest, MessagesAreLostUntilTheDiskIsTriedAgain) {
+  history_.begin();
+  platform_.overflow.setWriteError(platform::Error{.description = "disk full"});
+  record(0, 2000);
+  platform_.overflow.setWriteError(std::nullopt);
+  const std::size_t lost = outcomes_[Outcome::kNoRoom];
+
+  platform_.clock.advance(249ms);
+  record(2000, 2001);
+  EXPECT_EQ(outcomes_[Outcome::kNoRoom], lost + 1);
+  platform_.clock.advance(1ms);
+  record(2001, 2002);
+
+  EXPECT_EQ(outcomes_[Outcome::kNoRoom], lost + 1);
+  EXPECT_EQ(recorded().back().identifier, "Playback_Start_2002");
+}
+
+TEST_F(MessageHistoryOverflowTest, ANewRunTriesAtOnce) {
+  history_.begin();
+  platform_.overflow.setWriteError(platform::Error{.description = "disk full"});
+  record(0, 2000);
+  platform_.overflow.setWriteError(std::nullopt);
+  outcomes_.clear();
+
+  history_.begin();
+  record(0, 2000);
+
+  EXPECT_EQ(outcomes_[Outcome::kNoRoom], 0U);
 }
 
 TEST_F(MessageHistoryOverflowTest, IdentifiersGoOnAfterALoss) {
@@ -156,6 +202,7 @@ TEST_F(MessageHistoryOverflowTest, IdentifiersGoOnAfterALoss) {
   platform_.overflow.setWriteError(platform::Error{.description = "disk full"});
   record(0, 5000);
   platform_.overflow.setWriteError(std::nullopt);
+  platform_.clock.advance(250ms);
 
   record(5000, 5001);
 

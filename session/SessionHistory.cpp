@@ -1,5 +1,6 @@
 #include "session/SessionHistory.h"
 
+#include "platform/clock.h"
 #include "platform/overflow.h"
 #include "platform/services.h"
 #include "session/SessionLog.h"
@@ -12,6 +13,8 @@ constexpr std::size_t kLeastToMove = 4 * 1024;
 // Bytes that one history may hold in memory: tens of thousands of ordinary messages, so that most
 // sessions never touch the disk.
 constexpr std::size_t kMostInMemory = 1024 * 1024;
+// As often as the store tries to write again.
+constexpr std::chrono::milliseconds kRetryTime{250};
 
 // Errors are never suppressed, however often they repeat. The category is compared as a whole, so
 // an error category with a domain is not exempt; this is required.
@@ -21,7 +24,12 @@ bool isExemptFromSuppression(AudioEventCategory category, AudioEventType type) {
 
 }  // namespace
 
-void SessionHistory::begin() { history_.set(MessageHistory()); }
+void SessionHistory::begin() {
+  std::optional<MessageHistory> previous(std::in_place);  // destroyed without the lock
+  const Lock history = lock();
+  history->swap(previous);
+  nextTry_ = {};
+}
 
 std::optional<MessageHistory> SessionHistory::end() {
   std::optional<MessageHistory> history = history_.take();
@@ -64,18 +72,28 @@ SessionHistory::Outcome SessionHistory::recordLocked(const Lock& history,
 }
 
 // When a history takes much memory, it goes on in a file. It loses a message only if writing the
-// file fails, for instance because the disk is full. The first loss of a run is logged and the
-// others are not, because a full disk stays full for many messages.
-bool SessionHistory::makeRoom(MessageHistory& messages) const {
+// file fails, for instance because the disk is full.
+bool SessionHistory::makeRoom(MessageHistory& messages) {
   const std::size_t movable = messages.movableSize();
   if (movable < kLeastToMove) return true;
   if (movable < kMostInMemory && !isClientOverItsShare()) return true;
+  return tryToMoveOut(messages);
+}
+
+// A full disk stays full for many messages. A loss is therefore logged once in a run, and a write
+// of 64 KiB is not repeated for each message.
+bool SessionHistory::tryToMoveOut(MessageHistory& messages) {
+  const std::chrono::milliseconds now = platform::clock().processUptime();
+  if (now < nextTry_) return false;
   const auto error = messages.moveOut();
-  if (error.has_value() && messages.lost() == 0) {
-    kSessionLog.error("cannot move the history of a session out of memory: ", error->description,
+  if (!error.has_value()) return true;
+  nextTry_ = now + kRetryTime;
+  if (messages.lost() == 0) {
+    kSessionLog.error("cannot move the history of reporter ", number(reporterID_),
+                      " out of memory: ", error->description,
                       "; its messages are missing from the summary until there is room");
   }
-  return !error.has_value();
+  return false;
 }
 
 bool SessionHistory::isClientOverItsShare() const {

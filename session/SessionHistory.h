@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <optional>
@@ -16,7 +17,8 @@ namespace halvox {
 // messages are not recorded.
 //
 // A history that takes much memory goes on outside memory. If that fails, for instance because the
-// disk is full, it loses messages until there is room again, and logs the first loss of a run.
+// disk is full, it loses messages until there is room again. It tries again at most four times a
+// second, and logs the first loss of a run.
 //
 // Owned by the session. Any thread may call; the history has one lock, which also guards the
 // counts of its identifiers.
@@ -29,8 +31,9 @@ class SessionHistory {
   // next one like a recorded message.
   enum class Outcome : std::uint8_t { kRecorded, kRedundant, kNotStarted, kNoRoom };
 
-  // Charges the history to `held`, which must outlive this.
-  explicit SessionHistory(ResourceTally& held) : held_(held) {}
+  // Charges the history to `held`, which must outlive this. Log lines name the reporter.
+  SessionHistory(ReporterID reporterID, ResourceTally& held)
+      : reporterID_(reporterID), held_(held) {}
 
   // Begins a run with an empty history.
   void begin();
@@ -53,11 +56,16 @@ class SessionHistory {
                        const platform::Dictionary& message);
 
  private:
-  [[nodiscard]] bool makeRoom(MessageHistory& messages) const;
+  // Both are called with the history locked.
+  [[nodiscard]] bool makeRoom(MessageHistory& messages);
+  [[nodiscard]] bool tryToMoveOut(MessageHistory& messages);
   [[nodiscard]] bool isClientOverItsShare() const;
 
+  const ReporterID reporterID_;
   ResourceTally& held_;  // the session's
   Guarded<std::optional<MessageHistory>> history_;
+  // When to try again after a failure, in the process's uptime. Guarded by the lock of history_.
+  std::chrono::milliseconds nextTry_{0};
 };
 
 }  // namespace halvox

@@ -22,7 +22,7 @@ class SessionHistoryTest : public testing::Test {
   platform::FakePlatform platform_;
   const std::shared_ptr<ResourceAccount> account_ = std::make_shared<ResourceAccount>();
   ResourceTally held_;
-  SessionHistory history_{held_};
+  SessionHistory history_{ReporterID{7}, held_};
 };
 
 TEST_F(SessionHistoryTest, OutsideARunRecordsNothing) {

@@ -35,6 +35,11 @@ std::size_t FakeOverflowService::keptBytes() const {
   return bytes;
 }
 
+std::size_t FakeOverflowService::failedWrites() const {
+  const std::lock_guard lock(mutex_);
+  return failedWrites_;
+}
+
 std::size_t FakeOverflowService::memoryPerClient() const {
   const std::lock_guard lock(mutex_);
   return memoryPerClient_;
@@ -43,7 +48,10 @@ std::size_t FakeOverflowService::memoryPerClient() const {
 std::optional<Error> FakeOverflowService::write(std::span<const std::byte> bytes,
                                                 OverflowPlace& place) {
   const std::lock_guard lock(mutex_);
-  if (writeError_.has_value()) return writeError_;
+  if (writeError_.has_value()) {
+    ++failedWrites_;
+    return writeError_;
+  }
   pieces_.emplace(next_, std::vector<std::byte>(bytes.begin(), bytes.end()));
   place = {.offset = next_, .length = bytes.size()};
   next_ += bytes.size() + 1;  // so that even pieces without bytes have places of their own

@@ -26,6 +26,7 @@ class FakeOverflowService final : public OverflowService {
 
   // The bytes that were written and not released.
   [[nodiscard]] std::size_t keptBytes() const;
+  [[nodiscard]] std::size_t failedWrites() const;
 
   [[nodiscard]] std::size_t memoryPerClient() const override;
   std::optional<Error> write(std::span<const std::byte> bytes, OverflowPlace& place) override;
@@ -38,6 +39,7 @@ class FakeOverflowService final : public OverflowService {
   std::size_t memoryPerClient_ = std::size_t{64} * 1024 * 1024;
   std::optional<Error> writeError_;
   std::optional<Error> readError_;
+  std::size_t failedWrites_ = 0;
   std::uint64_t next_ = 0;
   std::map<std::uint64_t, std::vector<std::byte>> pieces_;  // by offset
 };
