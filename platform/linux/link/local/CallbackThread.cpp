@@ -17,7 +17,8 @@ void CallbackThread::call(Callback callback) {
       return;
     }
   }
-  // The system cannot start a thread. The callback must still not run on the caller's thread.
+  // The system cannot start a thread. Use the background queue, because even then the callback must
+  // not run on the caller's thread.
   dispatch_.asyncAfterOnBackgroundQueue(std::chrono::nanoseconds(0), std::move(callback));
 }
 
@@ -34,7 +35,8 @@ void CallbackThread::stop() {
 
 // Returns false if the system cannot start a thread.
 bool CallbackThread::provideThread() {
-  // An earlier thread has released the lock for the last time: join() returns at once.
+  // If there is an earlier thread, it has released the lock for the last time, and join() returns
+  // at once.
   if (thread_.joinable()) thread_.join();
   try {
     thread_ = std::thread(&CallbackThread::run, this);
@@ -52,8 +54,8 @@ void CallbackThread::run() {
     {
       const MutexLock lock(mutex_);
       if (waiting_.empty()) {
-        // The thread ends at once instead of waiting for more: callbacks are as rare as starts of
-        // sessions.
+        // End the thread instead of waiting for more callbacks, because they are as rare as starts
+        // of sessions.
         isRunning_ = false;
         return;
       }

@@ -10,9 +10,9 @@
 namespace halvox::platform::linux_ {
 
 // Calls the callbacks of link back-ends that have no thread of their own, one after the other in
-// the order of call(). The thread starts with the first callback and ends when none is left: an
-// idle service has no such thread. If the system cannot start a thread, the background queue of
-// `dispatch` calls them instead.
+// the order of call(). The thread starts for the first callback and ends when none is left. An idle
+// service therefore has no such thread. If the system cannot start a thread, the background queue
+// of `dispatch` calls the callbacks.
 // Threads: any may call. Owner: the platform, which also owns `dispatch`; `dispatch` must exist
 // during call().
 class CallbackThread {

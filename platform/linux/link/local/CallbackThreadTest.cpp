@@ -43,11 +43,11 @@ TEST_F(CallbackThreadTest, CallsInOrderOnAThreadOfItsOwn) {
   EXPECT_NE(where, std::this_thread::get_id());
 }
 
-// ThreadSanitizer starts a thread of its own beside the first one of a program.
+// ThreadSanitizer starts a thread of its own when a program starts its first thread.
 void letTheSanitizerStartItsThread() {
   pid_t first = 0;
   std::thread([&] { first = ::gettid(); }).join();
-  // The kernel lists a joined thread for a moment longer.
+  // The kernel still lists a thread for a moment after it was joined.
   const std::string task = "/proc/self/task/" + std::to_string(first);
   ASSERT_TRUE(eventually([&] { return !std::filesystem::exists(task); }));
 }

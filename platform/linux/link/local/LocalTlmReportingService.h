@@ -6,9 +6,9 @@
 
 namespace halvox::platform::linux_ {
 
-// The real-time reporting framework of a machine without servers: every message becomes a record of
-// the store, with the time of the call, in the order of the calls. There is one back-end, "local",
-// and every discovery finds it.
+// The real-time reporting framework of a machine without servers. Every message becomes a record of
+// the store, with the time of the call and in the order of the calls. There is one back-end,
+// "local", and every discovery finds it.
 //
 // The store's writer commits a message within half a second, even if its session has ended. A flush
 // therefore completes at once. The store counts the messages that it cannot write.
@@ -17,12 +17,12 @@ namespace halvox::platform::linux_ {
 // outlive this object and its sessions.
 class LocalTlmReportingService final : public ServerlessTlmReportingService {
  public:
-  // Discoveries are answered on the thread of `callbacks`.
+  // `callbacks` answers discoveries on its thread.
   LocalTlmReportingService(SqliteStore& store, const ClockService& clock,
                            CallbackThread& callbacks);
 
-  // False while the store is behind: a send may then wait for room, and the thread that carries out
-  // the requests of all clients must not wait.
+  // Returns false while many records wait for the store. A send may then have to wait, and the
+  // thread that carries out the requests of all clients must not wait.
   [[nodiscard]] bool onlyNotesMessages() const override { return !store_.isBehind(); }
 
  private:

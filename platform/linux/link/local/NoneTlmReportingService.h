@@ -5,13 +5,13 @@
 
 namespace halvox::platform::linux_ {
 
-// The real-time reporting framework of a service whose link is disabled: no discovery finds a
+// The real-time reporting framework of a service whose link is disabled. No discovery finds a
 // back-end, and every message is counted and refused.
 // Threads: any may call; nothing blocks. Owner: the platform, which also owns the constructor's
 // arguments; these must outlive this object.
 class NoneTlmReportingService final : public ServerlessTlmReportingService {
  public:
-  // Discoveries are answered on the thread of `callbacks`.
+  // `callbacks` answers discoveries on its thread.
   NoneTlmReportingService(StatisticsService& statistics, CallbackThread& callbacks)
       : ServerlessTlmReportingService("none", std::nullopt, callbacks),
         received_(statistics.counter("link none", "received")),

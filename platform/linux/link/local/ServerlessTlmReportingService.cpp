@@ -9,14 +9,13 @@ namespace {
 
 constexpr std::size_t kLongestName = 255;
 
-// A client's configuration can give any value as a name, of any length, and names are stored with
-// every message. A name of 8 MiB would fill the store with a few small messages; names are
-// therefore cut, between characters.
+// Returns the name under `key`, cut between characters if it is long. A client's configuration can
+// have any value of any length as a name, and the name is stored with every message. With a name of
+// 8 MiB, a few small messages would fill the store.
 std::string nameOf(const Dictionary& info, std::string_view key) {
   const Value* const value = info.find(key);
   if (value == nullptr) return {};
-  // A value that is not a string is kept as text, so that the record still says what the client
-  // sent.
+  // Convert a value that is not a string to text. The record then still shows what the client sent.
   const std::string name = value->isString() ? std::string(value->string()) : describe(*value);
   return std::string(utf8Prefix(name, kLongestName));
 }
@@ -32,7 +31,7 @@ std::shared_ptr<const LinkParty> partyOf(const Dictionary& sessionInfo,
 
 }  // namespace
 
-// A session: what all its messages have in common. Immutable.
+// The data that all messages of one session have in common. Immutable.
 class ServerlessTlmReportingService::PartySession final : public TLMReportingSession {
  public:
   PartySession(std::string framework, std::shared_ptr<const LinkParty> party)
@@ -60,7 +59,8 @@ TLMReportingService::Session ServerlessTlmReportingService::TLMReportingCreateSe
 
 void ServerlessTlmReportingService::TLMReportingStartConfiguration(const Session& /*session*/,
                                                                    BackendsCallback found) {
-  // Answer on another thread: the port promises that `found` is not called inside this call.
+  // Answer on another thread, because the port promises that `found` is not called inside this
+  // call.
   callbacks_.call([found = std::move(found), backends = backends_] { found(backends); });
 }
 

@@ -19,7 +19,7 @@ namespace halvox::platform::linux_ {
 // this object.
 class ServerlessTlmReportingService : public TLMReportingService {
  public:
-  // The token's text begins with the framework's name.
+  // The text of the token begins with the name of the framework.
   Token TLMHierarchyTokenCreate() final;
   Session TLMReportingCreateSession(const Dictionary& sessionInfo,
                                     const Dictionary& userInfo) final;
@@ -35,7 +35,7 @@ class ServerlessTlmReportingService : public TLMReportingService {
  protected:
   static constexpr const char* kErrorDomain = "com.tarno.halvox.link";
 
-  // Discoveries are answered with `backends` on the thread of `callbacks`.
+  // Every discovery is answered with `backends`, on the thread of `callbacks`.
   ServerlessTlmReportingService(std::string name, std::optional<Array> backends,
                                 CallbackThread& callbacks)
       : name_(std::move(name)), backends_(std::move(backends)), callbacks_(callbacks) {}
@@ -43,7 +43,7 @@ class ServerlessTlmReportingService : public TLMReportingService {
  private:
   class PartySession;
 
-  // Accepts or refuses one message of that sender, on the caller's thread.
+  // Accepts or refuses one message of `sender`, on the caller's thread.
   virtual TLMReportingOutcome accept(const std::shared_ptr<const LinkParty>& sender,
                                      const TLMReportingMessage& message) = 0;
 

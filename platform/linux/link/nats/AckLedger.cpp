@@ -29,12 +29,12 @@ void AckLedger::resolve(Number message, AckOutcome outcome) {
   Account ended;
   {
     const MutexLock lock(mutex_);
-    // Most messages belong to no flush yet.
+    // In most cases no flush has been called since the message was added.
     if (message >= current_.first) return note(current_, outcome);
     const auto flush = std::ranges::find_if(flushes_, [message](const Account& account) {
       return message >= account.first && message <= account.last;
     });
-    if (flush == flushes_.end()) return;  // of a flush that was given up
+    if (flush == flushes_.end()) return;  // the flush of this message was given up
     note(*flush, outcome);
     if (flush->outstanding > 0) return;
     ended = std::move(*flush);
@@ -47,7 +47,8 @@ AckLedger::FlushId AckLedger::flush(Done done) {
   Account account;
   {
     const MutexLock lock(mutex_);
-    // Later messages belong to the next flush: this one must end although others follow.
+    // Messages that are added later belong to the next flush. This flush must end even if messages
+    // keep coming.
     account = std::exchange(current_, Account{});
     current_.first = account.last + 1;
     current_.last = account.last;
@@ -71,7 +72,7 @@ void AckLedger::giveUp(FlushId id) {
     flushes_.erase(flush);
   }
   ended.tally.notAcknowledged += ended.outstanding;
-  // Call it without the lock: the callback may send or flush again.
+  // Call `done` without the lock, because it may send or flush again.
   ended.done(ended.tally);
 }
 

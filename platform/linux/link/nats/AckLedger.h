@@ -8,7 +8,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The result of the messages that one flush waited for.
+// How many of the messages for which one flush waited were acknowledged, and how many were not.
 struct AckTally {
   std::uint64_t acknowledged = 0;
   std::uint64_t notAcknowledged = 0;
@@ -21,12 +21,12 @@ enum class AckOutcome : std::uint8_t {
   kRefused,  // the sender got an error instead; no flush counts it
 };
 
-// Accounts for the acknowledgements of one session, for which its flushes wait. A flush waits for
-// the messages added since the previous flush, never for later ones, and reports the result of
-// exactly these: a session that keeps sending must not delay its own flush. Threads: any; no
-// function blocks. A `done` callback runs on the thread that resolves the last message, or that
-// calls flush() or giveUp(), with no lock held. Owners: the session, and each of its messages until
-// it is resolved.
+// Counts the acknowledgements of one session for the session's flushes. A flush waits for the
+// messages that were added since the previous flush, and reports the result of exactly these. It
+// never waits for later messages, because a session that keeps sending must not delay its own
+// flush. Threads: any; no function blocks. A `done` callback runs on the thread that resolves the
+// last message, or that calls flush() or giveUp(), with no lock held. Owners: the session, and each
+// of its messages until the message is resolved.
 class AckLedger {
  public:
   using Done = std::function<void(const AckTally&)>;
@@ -37,11 +37,11 @@ class AckLedger {
   [[nodiscard]] Number add() HALVOX_EXCLUDES(mutex_);
   void resolve(Number message, AckOutcome outcome) HALVOX_EXCLUDES(mutex_);
 
-  // Calls `done` exactly once: when all messages are resolved, possibly before this returns, or
-  // from giveUp(). Returns 0 when `done` has run already.
+  // Calls `done` exactly once: when all messages are resolved, which may be before flush() returns,
+  // or from giveUp(). Returns 0 if `done` has run already.
   FlushId flush(Done done) HALVOX_EXCLUDES(mutex_);
-  // Ends a flush that still waits; its unresolved messages count as not acknowledged. Does nothing
-  // for a flush that is done.
+  // Ends a flush that still waits. Its unresolved messages count as not acknowledged. Does nothing
+  // if the flush has ended.
   void giveUp(FlushId id) HALVOX_EXCLUDES(mutex_);
 
  private:

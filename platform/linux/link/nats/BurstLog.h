@@ -7,8 +7,9 @@
 
 namespace halvox::platform::linux_ {
 
-// Limits the log lines of a burst of failures: the first failure gets a line; after it, at most one
-// line a second covers all failures since the previous line. Not thread-safe: the owner locks.
+// Limits the log lines of a burst of failures. The first failure gets a line. After it, there is at
+// most one line a second, which covers all failures since the previous line. Not thread-safe; the
+// owner must hold a lock.
 class BurstLog {
  public:
   using Time = std::chrono::steady_clock::time_point;

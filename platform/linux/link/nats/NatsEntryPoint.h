@@ -7,7 +7,7 @@ namespace halvox::platform::linux_ {
 
 inline constexpr Module kNatsModule{"halvox-link-nats.so", "halvox_link_nats_1"};
 
-// Makes the back-end, which the caller owns.
+// Makes the back-end. The caller owns it.
 extern "C" NatsTlmReporting* halvox_link_nats_1(const Configuration::Link& options,
                                                 const NatsEnvironment& environment);
 

@@ -11,8 +11,8 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
-// How long to wait for the threads of the library, which have no work left. If they need longer,
-// one of them hangs.
+// How long close() waits for the threads of the library to end. They have no work left; if they
+// need longer, one of them hangs.
 constexpr std::chrono::milliseconds kLibraryEndTime{2000};
 constexpr std::int64_t kDefaultSpin = -1;  // how long the library spins on its locks
 }  // namespace
@@ -24,8 +24,8 @@ NatsLink::NatsLink(Configuration::Link options, const NatsEnvironment& environme
         const MutexLock lock(mutex_);
         changed_.notifyAll();
       }) {
-  // A connection would open the library, but messages are made, and may be destroyed, before the
-  // first connection.
+  // Open the library now. A connection would open it, too, but messages are made, and may be
+  // destroyed, before the first connection.
   if (const natsStatus status = nats_Open(kDefaultSpin); status != NATS_OK) {
     kLog.error("cannot start the NATS client library: ", natsStatus_GetText(status),
                "; no server can be reached");
@@ -40,13 +40,13 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
   {
     const MutexLock lock(mutex_);
     const bool isRefused = closeBy_.has_value();
-    // The first session that looks for back-ends starts the thread: a service without sessions
+    // Start the thread only when a session looks for back-ends, because a service without sessions
     // needs no link.
     if (!isRefused) failure = provideThread();
     if (!isRefused && failure.empty()) {
       wakeThread();
-      // Do not call `found` from here: it must run later, on a thread of ours. The session logs
-      // that it waits after this returns.
+      // Do not call `found` here. It must run later, on the link's thread, because the session logs
+      // that it waits for back-ends only after discover() has returned.
       if (state_ == State::kConnected) return answers_.push_back({std::move(found), servers_});
       waiter = ++lastWaiter_;
       waiters_.push_back({waiter, std::exchange(found, nullptr)});
@@ -54,11 +54,12 @@ void NatsLink::discover(TLMReportingService::BackendsCallback found) {
   }
   if (!failure.empty()) kLog.error("a session starts without NATS servers: ", failure);
   if (waiter == 0) {
-    // There is no thread of ours to call back on.
+    // The link's thread does not run. Call back on the background queue.
     return dispatch_.asyncAfterOnBackgroundQueue(
         std::chrono::nanoseconds(0), [found = std::move(found)] { found(std::nullopt); });
   }
-  // Answer the callers without waiting for the end of the attempt, which cannot be cancelled.
+  // Answer this caller after kDiscoveryTime even if the attempt to connect has not ended. The
+  // attempt cannot be cancelled.
   dispatch_.asyncAfterOnBackgroundQueue(kDiscoveryTime, [link = weak_from_this(), waiter] {
     if (const auto self = link.lock()) self->expire(waiter);
   });
@@ -69,7 +70,7 @@ void NatsLink::expire(std::uint64_t waiter) {
   {
     const MutexLock lock(mutex_);
     const auto place = std::ranges::find(waiters_, waiter, &Waiter::id);
-    // The attempt has answered this caller already.
+    // If the caller is not in the list, it has been answered already.
     if (place == waiters_.end()) return;
     found = std::move(place->found);
     waiters_.erase(place);
@@ -83,8 +84,8 @@ std::optional<Error> NatsLink::refusal(std::size_t bytes) {
     return refusedByLink("the message has " + std::to_string(bytes) +
                          " bytes; the NATS server accepts at most " + std::to_string(maxPayload_));
   }
-  // Refuse the message if an attempt has just failed: the sender gets the error at once, not after
-  // another time-out.
+  // If an attempt to connect has just failed, refuse the message. The sender then gets the error at
+  // once, not after another time-out.
   if (state_ == State::kIdle && !lastFailure_.empty() &&
       std::chrono::steady_clock::now() < nextAttempt_) {
     return refusedByLink("cannot connect to a NATS server: " + lastFailure_);
@@ -109,15 +110,15 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
   {
     const MutexLock lock(mutex_);
     error = refusal(message.bytes);
-    // Take it under this lock: after close() has begun, no message may enter the queue, because it
-    // would not be counted.
+    // Call take() under this lock. After close() has begun, no message may enter the queue, because
+    // it would not be counted.
     if (!error) error = publisher_.take(message);
     if (!error) {
       wakeThread();
       return std::nullopt;
     }
   }
-  // Refuse it without the lock: the ledger may call back a flush, which may send.
+  // Call refuse() without the lock. It may end a flush, whose callback may send.
   publisher_.refuse(message);
   return error;
 }
@@ -125,25 +126,28 @@ std::optional<Error> NatsLink::send(OutgoingMessage message) {
 bool NatsLink::close() {
   {
     const MutexLock lock(mutex_);
-    // This is not the first call. The thread is still joinable if it hung at the end of the first.
+    // This is not the first call. The thread is still joinable if it hung at the end of the first
+    // call.
     if (closeBy_) return !thread_.joinable();
     const Time now = std::chrono::steady_clock::now();
     closeBy_ = now + kCloseTime;
-    // An attempt that is under way may hang. A connection ends within known limits.
+    // An attempt to connect may hang and gets only a short time. A connection always ends within a
+    // known time.
     leaveBy_ =
         state_ == State::kConnecting ? now + kAttemptEndTime : *closeBy_ + kConnectionEndTime;
     publisher_.beginEnd();
     changed_.notifyAll();
   }
-  // The thread may hang in the library with the lock of the connection. Neither can be destroyed.
+  // If the thread hangs in the library, it holds the lock of the connection. Neither the thread nor
+  // the connection can be destroyed then.
   if (!awaitThread()) {
     kLog.notice("a NATS server does not answer; closing without it, unsent messages are dropped");
     giveUpRest();
     keepForEver();
     return false;
   }
-  // Once the library has ended, it calls no callback. Otherwise one may still run, and this object
-  // must stay.
+  // When the library has ended, it calls no more callbacks. If it does not end, a callback may
+  // still run, and this object must stay.
   if (nats_CloseAndWait(kLibraryEndTime.count()) == NATS_OK) return true;
   kLog.error("the NATS client library did not end within ", kLibraryEndTime.count(),
              " ms; leaving it running until the process ends");
@@ -151,8 +155,9 @@ bool NatsLink::close() {
   return true;
 }
 
-// Returns false if the thread still runs at leaveBy_. The thread itself sets leaveBy_: to a later
-// time before work that ends within known limits, to an earlier one before work that may hang.
+// Returns false if the thread still runs at leaveBy_. The thread changes leaveBy_ itself: to a
+// later time before work that ends within a known time, and to an earlier one before work that may
+// hang.
 bool NatsLink::awaitThread() {
   {
     const MutexLock lock(mutex_);
@@ -167,7 +172,8 @@ bool NatsLink::awaitThread() {
   return true;
 }
 
-// The part of end() that needs no connection, while the thread hangs in the library.
+// If the thread hangs in the library, this function does the part of end() that needs no
+// connection.
 void NatsLink::giveUpRest() {
   {
     const MutexLock lock(mutex_);
@@ -194,7 +200,7 @@ std::string NatsLink::provideThread() {
 }
 
 void NatsLink::wakeThread() {
-  // Wake the thread only if it waits. A working thread finds the next step by itself.
+  // Wake the thread only if it waits. If it works, it looks for the next step by itself.
   if (!std::exchange(isIdle_, false)) return;
   changed_.notifyAll();
 }
@@ -203,21 +209,22 @@ bool NatsLink::hasConnection() const {
   return state_ != State::kIdle && state_ != State::kConnecting;
 }
 
-// Whether a caller or a queued message needs a connection.
+// Returns true if a caller or a queued message needs a connection.
 bool NatsLink::isNeeded() { return !waiters_.empty() || publisher_.hasQueued(); }
 
-// After close(): whether no work or no time remains.
+// Returns true if close() was called and no work or no time remains.
 bool NatsLink::isAtEnd(Time now) {
   if (!closeBy_) return false;
   return !hasConnection() || state_ == State::kLost || publisher_.isDone() || now >= *closeBy_;
 }
 
 NatsLink::Step NatsLink::nextStep(Time now) {
-  // Check for the end before all other steps: close() waits for it only for a limited time.
+  // Check for the end before all other steps, because close() waits only for a limited time.
   if (isAtEnd(now)) return Step::kEnd;
   if (!answers_.empty()) return Step::kCallBack;
   if (state_ == State::kLost) return Step::kDrop;
-  // Abandon overdue messages before connecting, which can take seconds: a flush waits for them.
+  // Abandon overdue messages before connecting. A flush may wait for them, and connecting can take
+  // seconds.
   if (const auto deadline = publisher_.firstDeadline(); deadline && now >= *deadline) {
     return Step::kAbandon;
   }
@@ -227,7 +234,7 @@ NatsLink::Step NatsLink::nextStep(Time now) {
   return publisher_.canPublish(now) ? Step::kPublish : Step::kWait;
 }
 
-// The time at which nextStep() can return another step although nothing has changed.
+// Returns the time at which nextStep() can return another step without any other change.
 std::optional<NatsLink::Time> NatsLink::nextTime() {
   std::optional<Time> next = closeBy_;
   const auto consider = [&next](std::optional<Time> time) {
@@ -258,7 +265,8 @@ void NatsLink::run() {
       step = nextStep(std::chrono::steady_clock::now());
       if (step == Step::kWait) waitForChange();
     }
-    // Perform the step without the lock: most steps call the library, and some wait for a server.
+    // Perform the step without the lock, because most steps call the library and some wait for a
+    // server.
     if (!perform(step)) return;
   }
 }
@@ -294,13 +302,13 @@ bool NatsLink::perform(Step step) {
 
 void NatsLink::end() {
   {
-    // The library cannot close a connection while it tries to reconnect, because it holds the lock
-    // of the connection: dropConnection() may then hang.
+    // While the library tries to reconnect, it holds the lock of the connection, and closing the
+    // connection may hang. In that case dropConnection() gets only a short time.
     const MutexLock lock(mutex_);
     if (state_ != State::kConnected) leaveBy_ = std::chrono::steady_clock::now() + kAttemptEndTime;
     changed_.notifyAll();
   }
-  // Waits for what the library's threads still have to do, then closes.
+  // First let the library's threads finish their work, then close the connection.
   drain();
   dropConnection();
   answerWaiters();
@@ -310,8 +318,8 @@ void NatsLink::end() {
   changed_.notifyAll();
 }
 
-// Calls back all callers of discover(): with the servers, or with std::nullopt when none is
-// connected.
+// Calls back all callers of discover(), with the servers or, if none is connected, with
+// std::nullopt.
 void NatsLink::answerWaiters() {
   std::vector<Waiter> waiters;
   std::optional<Array> servers;
@@ -321,7 +329,7 @@ void NatsLink::answerWaiters() {
     if (state_ == State::kConnected) servers = servers_;
   }
   callBackAnswers();
-  // Call them without the lock: a callback may call discover() or send() again.
+  // Call the callbacks without the lock, because a callback may call discover() or send() again.
   for (const Waiter& waiter : waiters) waiter.found(servers);
 }
 

@@ -16,8 +16,9 @@
 
 namespace halvox::platform::linux_ {
 
-// The one connection to the servers, which all sessions share, and the one thread that may wait for
-// a server: it connects, finds the stream, and drives the publisher. Callers only queue.
+// The one connection to the servers, which all sessions share, and its thread. Only this thread may
+// wait for a server: it connects, finds the stream, and runs the publisher. Callers only add
+// messages to a queue.
 //
 //   idle --first need--> connecting --> away <--> connected
 //     ^                       |           \          /
@@ -26,31 +27,36 @@ namespace halvox::platform::linux_ {
 //
 //   away: the library has a connection object without a server, and reconnects without end.
 //   lost: the library has closed the connection, for example because a server refused our
-//         credentials. The thread drops it; the next need makes a new one.
+//         credentials. The thread drops the object; the next attempt makes a new one.
 //
-// There is at most one attempt to connect at a time; all callers of discover() wait for it, but no
-// longer than kDiscoveryTime. After a failed attempt, the next one begins on demand, and not before
-// kAttemptPause has passed: an idle service without servers causes no wake-ups.
+// There is at most one attempt to connect at a time. All callers of discover() wait for it, but no
+// longer than kDiscoveryTime. After a failed attempt, the next one begins only when a session needs
+// a server, and not before kAttemptPause has passed. An idle service without servers therefore
+// causes no wake-ups.
 //
-// An attempt of the library cannot be cancelled: it holds the lock of its connection object. It can
-// take for ever, because the library sets no time limit for a TLS handshake. close() therefore
-// waits a bounded time. If the thread still hangs then, close() abandons all messages and no longer
-// waits for the thread.
+// An attempt cannot be cancelled, because the library holds the lock of its connection object
+// during the attempt. An attempt may never end, because the library sets no time limit for a TLS
+// handshake. close() therefore waits only for a bounded time. If the thread still hangs then,
+// close() abandons all messages and does not wait for the thread any longer.
 //
 // Threads: all public functions may be called by any thread; only close() blocks. Locks: this
 // class's lock first, then the publisher's, never the other way round.
 // Owner: NatsTlmReportingService. Delayed jobs of discover() hold a weak reference.
 class NatsLink : public std::enable_shared_from_this<NatsLink> {
  public:
-  // Less than the 9 seconds that a session waits for its back-ends.
+  // How long a caller of discover() waits at most: less than the 9 seconds that a session waits for
+  // its back-ends.
   static constexpr std::chrono::seconds kDiscoveryTime{8};
-  // Bounds the load on the network when many sessions start while no server answers.
+  // The pause after a failed attempt. Bounds the load on the network when many sessions start while
+  // no server answers.
   static constexpr std::chrono::seconds kAttemptPause{1};
   // How long close() waits for acknowledgements. Slow machines need more than one second.
   static constexpr std::chrono::seconds kCloseTime{3};
-  // How long close() waits for an attempt under way. An attempt that takes longer usually hangs.
+  // How long close() waits for an attempt that has begun. An attempt that takes longer usually
+  // hangs.
   static constexpr std::chrono::milliseconds kAttemptEndTime{500};
-  // More than the sum of the library's limits for the end of a connection: the drain and a write.
+  // How long close() waits for the end of a connection: longer than the library's limits for the
+  // drain and for a write together.
   static constexpr std::chrono::seconds kConnectionEndTime{5};
 
   NatsLink(Configuration::Link options, const NatsEnvironment& environment);
@@ -58,20 +64,21 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   NatsLink& operator=(const NatsLink&) = delete;
   ~NatsLink();  // calls close(), if the owner did not
 
-  // Calls `found` exactly once, and never before this returns. Passes the servers' addresses on the
-  // link's thread, even if a server is connected already. Passes std::nullopt on that thread after
-  // a failed attempt, or on the background queue after kDiscoveryTime.
+  // Calls `found` exactly once, and never before discover() returns. If a server is or gets
+  // connected, calls `found` with the servers' addresses on the link's thread. After a failed
+  // attempt, calls it with std::nullopt on that thread. After kDiscoveryTime, calls it with
+  // std::nullopt on the background queue.
   void discover(TLMReportingService::BackendsCallback found) HALVOX_EXCLUDES(mutex_);
   // After close(), counts a message as refused and returns the error for its sender. Before
-  // close(), returns none. Call it before creating a message: after close() the library has ended,
-  // and creating a message would crash.
+  // close(), returns std::nullopt. Call it before creating a message, because after close() the
+  // library has ended and creating a message would crash.
   [[nodiscard]] std::optional<Error> refuseAtEnd() HALVOX_EXCLUDES(mutex_);
   // Queues the message. Returns an error if the service is ending, the message is larger than the
   // server accepts, the queue is full, or an attempt to connect failed within kAttemptPause.
   [[nodiscard]] std::optional<Error> send(OutgoingMessage message) HALVOX_EXCLUDES(mutex_);
   // Publishes queued messages for at most kCloseTime, then ends the connection and the library.
-  // Returns false if the thread still runs: this object then exists until the process ends, and
-  // `environment` must, too. Further calls return the same result.
+  // Returns false if the thread still runs. This object then exists until the process ends, and
+  // `environment` must exist as long. Further calls return the same result.
   [[nodiscard]] bool close() HALVOX_EXCLUDES(mutex_);
 
  private:
@@ -81,7 +88,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
     std::uint64_t id;
     TLMReportingService::BackendsCallback found;
   };
-  // A call of discover() while a server was connected; the thread only has to call back.
+  // A call of discover() that came while a server was connected. The thread only has to call back.
   struct Answer {
     TLMReportingService::BackendsCallback found;
     Array servers;
@@ -98,7 +105,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
     kEnd
   };
 
-  // Callers and the thread's loop (NatsLink.cpp).
+  // The functions for callers and the loop of the thread (NatsLink.cpp).
   void run() HALVOX_EXCLUDES(mutex_);
   // Returns false after the last step.
   [[nodiscard]] bool perform(Step step) HALVOX_EXCLUDES(mutex_);
@@ -119,7 +126,7 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   void expire(std::uint64_t waiter) HALVOX_EXCLUDES(mutex_);
   [[nodiscard]] std::optional<Error> refusal(std::size_t bytes) HALVOX_REQUIRES(mutex_);
 
-  // The connection (NatsLinkConnection.cpp).
+  // The functions of the connection (NatsLinkConnection.cpp).
   void connect() HALVOX_EXCLUDES(mutex_);
   void endAttempt(State state) HALVOX_REQUIRES(mutex_);
   void failAttempt(const std::string& failure) HALVOX_EXCLUDES(mutex_);
@@ -151,8 +158,9 @@ class NatsLink : public std::enable_shared_from_this<NatsLink> {
   std::size_t maxPayload_ HALVOX_GUARDED_BY(mutex_) = 0;  // bytes; 0 when not known
   BurstLog attemptLog_ HALVOX_GUARDED_BY(mutex_);
 
-  // Changed by the thread alone, under the lock. Threads of the library compare it with the
-  // connection that they report about, which may be one that was dropped.
+  // Only the link's thread changes these members, under the lock. Threads of the library compare
+  // `connection_` with the connection that they report about, because that one may have been
+  // dropped.
   NatsConnection connection_;
   JetStreamContext context_;
   std::thread thread_;

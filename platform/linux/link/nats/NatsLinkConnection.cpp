@@ -11,29 +11,32 @@ namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
-// The library tries one server after the other, and a server that accepts and stays silent takes
-// its whole time-out. All servers together get kServersTime, and the stream gets two requests. The
-// sum is 7.5 seconds: the attempt ends before the callers of discover() give up (kDiscoveryTime).
+// The time limits of one attempt. The library tries one server after the other, and a server that
+// accepts the connection and then stays silent takes its whole time-out. All servers together get
+// kServersTime, and looking for the stream takes up to two requests. The sum is 7.5 seconds. The
+// attempt therefore ends before the callers of discover() give up (kDiscoveryTime).
 constexpr std::chrono::milliseconds kServerTime{2000};
 constexpr std::chrono::milliseconds kShortestServerTime{100};
 constexpr std::chrono::milliseconds kServersTime{6000};
 constexpr std::chrono::milliseconds kRequestTime{750};
 static_assert(kServersTime + 2 * kRequestTime < NatsLink::kDiscoveryTime);
-// A server that does not read for this long counts as disconnected. close() can wait for one write.
+// A server that does not read for this long counts as disconnected. close() may have to wait for
+// one write.
 constexpr std::chrono::milliseconds kWriteTime{2000};
-// Reconnects quickly after a restart of a server; the jitter spreads the services of a fleet.
+// The pause is short, to reconnect quickly after a restart of a server. The jitter keeps the
+// services of a fleet from reconnecting at the same moment.
 constexpr std::chrono::milliseconds kReconnectPause{250};
 constexpr std::chrono::milliseconds kReconnectJitter{250};
-// A server that vanished without closing the connection is noticed within a minute. More frequent
-// pings would wake the service more often and gain little: a missing acknowledgement shows the loss
-// sooner.
+// With these pings, the library notices within a minute that a server has vanished without closing
+// the connection. More frequent pings would wake the service more often and gain little, because a
+// missing acknowledgement shows the loss sooner.
 constexpr std::chrono::milliseconds kPingPause{20'000};
 constexpr int kLostPings = 2;
 constexpr int kForEver = -1;
 
-// While servers are away the library must buffer nothing: its buffer would overtake the messages
-// that were on their way, see NatsPublisher. 0 disables the buffer, although the library documents
-// 0 as its default size; with 1 byte it buffers a whole message.
+// The library must not buffer messages while it has no server. They would overtake the messages
+// that were sent but not acknowledged; see NatsPublisher. 0 disables the buffer, although the
+// library documents that 0 stands for its default size. With 1 byte it buffers a whole message.
 constexpr int kReconnectBufferBytes = 0;
 constexpr std::chrono::milliseconds kDrainTime{1000};
 static_assert(2 * kDrainTime + kWriteTime < NatsLink::kConnectionEndTime);
@@ -91,8 +94,8 @@ natsStatus NatsLink::configure(natsOptions* options) {
   const auto closed = [](natsConnection* connection, void* link) {
     static_cast<NatsLink*>(link)->onClosed(connection);
   };
-  // The default handler prints to stderr. The acknowledgements already show the effects of these
-  // errors.
+  // Replace the default handler, which prints to stderr. The acknowledgements already show the
+  // effects of these errors.
   const auto ignore = [](natsConnection*, natsSubscription*, natsStatus, void*) {};
   for (const natsStatus status :
        {natsOptions_SetServers(options, urls.data(), static_cast<int>(urls.size())),
@@ -117,8 +120,8 @@ natsStatus NatsLink::configure(natsOptions* options) {
   return secure(options, options_);
 }
 
-// Returns why it failed; empty on success. On failure the caller closes `connection`, if there is
-// one.
+// Connects and finds the stream. Returns why it failed; empty on success. After a failure the
+// caller must close `connection` if there is one.
 std::string NatsLink::open(NatsConnection& connection, JetStreamContext& context) {
   NatsOptionsHandle options;
   natsStatus status = natsOptions_Create(options.out());
@@ -145,7 +148,8 @@ void NatsLink::connect() {
   }
   NatsConnection connection;
   JetStreamContext context;
-  // Connect without the lock, because this can take seconds. Callers only queue meanwhile.
+  // Connect without the lock, because this can take seconds and callers must be able to queue
+  // messages.
   const std::string failure = open(connection, context);
   if (!failure.empty()) {
     if (connection) natsConnection_Close(connection.get());
@@ -154,19 +158,21 @@ void NatsLink::connect() {
   natsConnection* const opened = connection.get();
   {
     const MutexLock lock(mutex_);
-    // Until here, callbacks for this connection were ignored, because connection_ was not yet set
-    // to it.
+    // Callbacks for this connection have been ignored until now, because connection_ was not set to
+    // it. Ask the library whether the connection was closed in that time.
     endAttempt(natsConnection_IsClosed(opened) ? State::kLost : State::kAway);
     connection_ = std::move(connection);
     context_ = std::move(context);
     lastFailure_.clear();
   }
   kLog.notice("connected to NATS");
-  // The library calls back for reconnections, not for the first connection.
+  // Call onAvailable() here, because the library calls it only after a reconnection, not after the
+  // first connection.
   onAvailable(opened);
 }
 
-// Everything that waits for a server fails with the attempt: keeping it would only delay the error.
+// Ends a failed attempt. Queued messages and waiting callers fail with it, because keeping them
+// would only delay their error.
 void NatsLink::failAttempt(const std::string& failure) {
   std::optional<std::uint64_t> worthALine;
   {
@@ -179,19 +185,20 @@ void NatsLink::failAttempt(const std::string& failure) {
   }
   if (worthALine)
     kLog.error("cannot connect to a NATS server: ", failure,
-               "; trying again when a session needs it");
+               "; trying again when a session needs a server");
   publisher_.failQueued("no server");
   answerWaiters();
 }
 
-// After an attempt the thread does nothing that takes longer than close() allows.
+// Ends an attempt. After it, the thread does nothing that takes longer than kConnectionEndTime, and
+// close() can wait for it that long.
 void NatsLink::endAttempt(State state) {
   state_ = state;
   if (closeBy_) leaveBy_ = *closeBy_ + kConnectionEndTime;
 }
 
-// Lets the library's threads return from our callbacks. If the library ends while one of them still
-// runs, the message that the callback was about to free leaks.
+// Lets the library's threads return from our callbacks. If the library ended while a callback still
+// runs, the message that the callback was about to free would leak.
 void NatsLink::drain() {
   natsConnection* const connection = connection_.get();
   {
@@ -219,7 +226,8 @@ void NatsLink::dropConnection() {
     servers_ = Array();
     isEnding = closeBy_.has_value();
   }
-  // Detach before closing the connection, which can hang until a server answers.
+  // Detach the publisher before closing the connection, because closing can hang until a server
+  // answers.
   publisher_.detach();
   if (isEnding) publisher_.failQueued("the service ended");
   if (connection) natsConnection_Close(connection.get());
@@ -232,8 +240,8 @@ void NatsLink::onAvailable(natsConnection* connection) {
   const std::int64_t maxPayload = natsConnection_GetMaxPayload(connection);
   const bool isConnected = natsConnection_Status(connection) == NATS_CONN_STATUS_CONNECTED;
   const MutexLock lock(mutex_);
-  // The library calls back on its own threads, possibly late: the connection may have been replaced
-  // or closed since.
+  // The library calls back on its own threads, and may do so late. The connection may have been
+  // replaced or closed since.
   if (connection != connection_.get() || !isConnected || state_ == State::kLost) return;
   state_ = State::kConnected;
   servers_ = servers;
@@ -246,8 +254,8 @@ void NatsLink::onAway(natsConnection* connection) {
     const MutexLock lock(mutex_);
     if (connection != connection_.get()) return;
     if (state_ == State::kConnected) state_ = State::kAway;
-    // Hold before the library reconnects. Otherwise, a message that is published after that would
-    // overtake the messages that were on their way.
+    // Hold messages now, before the library reconnects. A message that is published after the
+    // reconnection would otherwise overtake the messages that were sent but not acknowledged.
     publisher_.holdAfterLoss();
     changed_.notifyAll();
   }

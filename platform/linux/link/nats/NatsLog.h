@@ -6,7 +6,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The piece under which the back-end counts, see platform/statistics.h.
+// The name of the piece in the back-end's statistics; see platform/statistics.h.
 inline constexpr std::string_view kNatsPiece = "link to NATS";
 
 // The log category of the NATS back-end.

@@ -13,16 +13,18 @@ constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
 constexpr std::string_view kErrorDomain = "com.tarno.halvox.link";
 
-// How many messages are taken from the queue each time that the lock is held. The library is called
-// without the lock; senders would otherwise wait while it writes.
+// How many messages the publisher takes from the queue at a time. It takes them under the lock and
+// calls the library without the lock, because senders would otherwise wait while the library
+// writes.
 constexpr std::size_t kMessagesAtOnce = 64;
 
-// A message without an acknowledgement in this time counts as lost. The time is much longer than a
-// busy server needs, and short enough for a second attempt within the 5 seconds of a flush.
+// If a message is not acknowledged within this time, the attempt to publish it has failed. The time
+// is much longer than a busy server needs, and short enough for a second attempt within the 5
+// seconds of a flush.
 constexpr std::chrono::milliseconds kAttemptTime{3000};
 constexpr std::chrono::milliseconds kProbeTime{1000};
 
-// Whether another attempt can succeed where this one failed.
+// Returns true if another attempt to publish can succeed after this failure.
 bool isTemporary(natsStatus status, jsErrCode code = {}) {
   switch (status) {
     case NATS_NO_RESPONDERS:
@@ -33,7 +35,7 @@ bool isTemporary(natsStatus status, jsErrCode code = {}) {
     case NATS_IO_ERROR:
     case NATS_STALE_CONNECTION:
       return true;
-    default:  // a status of the library, which gains some
+    default:  // the library's statuses are many, and new versions add some
       return code == JSClusterNotAvailErr || code == JSClusterNotLeaderErr;
   }
 }
@@ -84,14 +86,15 @@ void NatsPublisher::abandonAll() {
     lost = pending_.takeAll();
     unsent = takeQueue();
   }
-  // Call these without the lock: the ledger may call back a flush, which may send.
+  // Call these functions without the lock. They may end a flush, whose callback may send.
   abandon(lost, "the connection ended");
   fail(unsent, "the service ended");
 }
 
 void NatsPublisher::attach(jsCtx* context, std::chrono::nanoseconds duplicates) {
   context_ = context;
-  // A stream that others made may recognise identifiers for a shorter time than our streams do.
+  // A stream that someone else created may recognise identifiers for a shorter time than our
+  // streams do.
   ackTime_ = std::min<std::chrono::nanoseconds>(kAckTime, duplicates / 2);
 }
 
@@ -146,20 +149,21 @@ bool NatsPublisher::canPublish(Time now) {
 }
 
 NatsPublisher::Step NatsPublisher::nextStep(Time now) {
-  // Wait until half of the window is free: waking the thread for every acknowledgement costs more
-  // than the acknowledgement itself.
+  // After the window was full, wait until half of it is free. Waking the thread for every
+  // acknowledgement would cost more than the acknowledgement itself.
   if (isWindowFull_ && pending_.isHalfFree()) isWindowFull_ = false;
-  // A probe keeps unacknowledged messages in order. Without such messages it has no purpose.
+  // The purpose of a probe is to keep unacknowledged messages in order. Without such messages,
+  // publish without a probe.
   if (pending_.size() == 0) flow_ = Flow::kFlowing;
   if (flow_ == Flow::kProbing) return Step::kWait;
   if (flow_ == Flow::kHolding) return now >= probeAt_ ? Step::kProbe : Step::kWait;
-  // Check these before the queue: new messages must not overtake messages that were published
-  // before.
+  // Check for messages to publish again before the queue, because new messages must not overtake
+  // them.
   if (pending_.needsAgain()) return pending_.hasAgain() ? Step::kSend : Step::kWait;
   return !queue_.empty() && !isWindowFull_ ? Step::kSend : Step::kWait;
 }
 
-// Decides again: an acknowledgement may have arrived since canPublish().
+// Calls nextStep() again, because an acknowledgement may have arrived since canPublish().
 void NatsPublisher::publishNext() {
   Step step = Step::kWait;
   {
@@ -176,8 +180,8 @@ void NatsPublisher::publishNext() {
   }
 }
 
-// Registers the messages as pending before they are published: an acknowledgement can arrive before
-// the call that publishes has returned.
+// Takes some messages to publish. Adds new ones to pending_ before they are published, because an
+// acknowledgement can arrive before the call that publishes has returned.
 std::vector<NatsMessage> NatsPublisher::takeSome() {
   std::vector<NatsMessage> taken;
   taken.reserve(kMessagesAtOnce);
@@ -209,14 +213,14 @@ void NatsPublisher::publishSome() {
 }
 
 void NatsPublisher::probe() {
-  // Look for the stream first: without it, this probe fails like the last one.
+  // Look for the stream first, because without it this probe would fail like the last one.
   provideStreamAgain();
   reclaim();
   std::vector<NatsMessage> messages;
   {
     const MutexLock lock(mutex_);
     pending_.beginAgain();
-    if (!pending_.hasAgain()) {  // all are settled, or a callback is settling the last one
+    if (!pending_.hasAgain()) {  // all are settled, or a callback settles the last one now
       probeAt_ = std::chrono::steady_clock::now() + kResendPause;
       return;
     }
@@ -227,8 +231,8 @@ void NatsPublisher::probe() {
   publish(std::move(messages), kProbeTime);
 }
 
-// Looks for the stream. It may have been deleted, or it may only have no leader: a publisher cannot
-// distinguish the two. Does not look with every probe; see kStreamCheckPause.
+// Looks for the stream, and creates it if it was deleted. A failed probe does not show whether the
+// stream was deleted or only has no leader. Does not look at every probe; see kStreamCheckPause.
 void NatsPublisher::provideStreamAgain() {
   const Time now = std::chrono::steady_clock::now();
   {
@@ -243,8 +247,8 @@ void NatsPublisher::provideStreamAgain() {
   kLog.error("NATS accepts no messages: ", provision.failure, "; messages wait");
 }
 
-// Takes back from the library the messages whose acknowledgements it still awaits, to publish them
-// again in order. The library would otherwise time out each of them by itself.
+// Takes back the messages for whose acknowledgements the library still waits, to publish them again
+// in order. The library would otherwise report a time-out for each of them separately.
 void NatsPublisher::reclaim() {
   natsMsgList list{};
   if (js_PublishAsyncGetPendingList(&list, context_) != NATS_OK) return;
@@ -263,7 +267,7 @@ void NatsPublisher::publish(std::vector<NatsMessage> messages, std::chrono::mill
   publishing.MaxWait = patience.count();
   for (std::size_t index = 0; index < messages.size(); ++index) {
     natsMsg* raw = messages[index].release();
-    // The call takes the message and sets `raw` to null, unless it fails.
+    // js_PublishMsgAsync() takes the message and sets `raw` to null, unless it fails.
     natsMsg* const key = raw;
     const natsStatus status = js_PublishMsgAsync(context_, &raw, &publishing);
     if (status == NATS_OK) continue;
@@ -276,7 +280,7 @@ void NatsPublisher::publish(std::vector<NatsMessage> messages, std::chrono::mill
   }
 }
 
-// Keeps messages for another attempt after one has failed.
+// Keeps messages for another attempt after their attempt has failed.
 void NatsPublisher::hold(std::span<NatsMessage> messages, natsStatus status) {
   std::optional<std::uint64_t> worthALine;
   {
@@ -285,8 +289,8 @@ void NatsPublisher::hold(std::span<NatsMessage> messages, natsStatus status) {
     for (NatsMessage& message : messages) {
       isKnown = pending_.giveBack(std::move(message)) || isKnown;
     }
-    // Each message of a window fails on its own. The first one begins the pause, and the others
-    // must not prolong it.
+    // The library reports the failure of each message separately. The first failure begins the
+    // pause, and the others must not prolong it.
     if (!isKnown || flow_ == Flow::kHolding) return;
     const Time now = std::chrono::steady_clock::now();
     if (flow_ == Flow::kProbing && status == NATS_NO_RESPONDERS) isStreamInDoubt_ = true;
@@ -335,17 +339,17 @@ void NatsPublisher::resolve(NatsMessage message, const jsPubAckErr* error) {
   {
     const MutexLock lock(mutex_);
     entry = pending_.take(message.get());
-    // Free the message here: once the thread sees that nothing is pending, it may end the library,
-    // which must not happen before the message is destroyed.
+    // Free the message under the lock. When the link's thread sees that nothing is pending, it may
+    // end the library, and the message must be destroyed before that.
     message.reset();
     const bool isProbed = flow_ == Flow::kProbing;
     if (isProbed) flow_ = Flow::kFlowing;
-    // Most acknowledgements need not wake the thread. These give it something to do.
+    // Most acknowledgements need not wake the thread. Wake it only if it has something to do now.
     isAwaited = isProbed || pending_.needsAgain() || (isWindowFull_ && pending_.isHalfFree()) ||
                 (isEnding_ && pending_.size() == 0);
   }
   if (isAwaited) wake_();
-  if (entry) settle(*entry, error);  // none for a message that was abandoned before
+  if (entry) settle(*entry, error);  // std::nullopt if the message was abandoned before
 }
 
 void NatsPublisher::settle(const PendingAcks::Entry& entry, const jsPubAckErr* error) {
@@ -354,7 +358,7 @@ void NatsPublisher::settle(const PendingAcks::Entry& entry, const jsPubAckErr* e
   } else {
     const std::string_view reason = natsStatus_GetText(error->Err);
     countFailure(1, error->ErrText != nullptr ? error->ErrText : reason);
-    // Look the counter up by name: there are many reasons, and failures are rare.
+    // Look the counter up by name each time, because there are many reasons and failures are rare.
     statistics_.counter(kNatsPiece, std::string("failed: ") + std::string(reason)).add();
   }
   if (!entry.ledger) return;

@@ -20,7 +20,7 @@
 
 namespace halvox::platform::linux_ {
 
-// A message before the client library has it.
+// A message that was not passed to the client library yet.
 struct OutgoingMessage {
   NatsMessage message;
   std::size_t bytes = 0;              // body and headers
@@ -28,8 +28,8 @@ struct OutgoingMessage {
   AckLedger::Number number = 0;
 };
 
-// Publishes messages in order over a connection that NatsLink makes and ends, and accounts for
-// every message: received = acknowledged + not acknowledged + failed, by reason.
+// Publishes messages in order over a connection that NatsLink makes and ends. Counts every message:
+// received = acknowledged + not acknowledged + failed (by reason) + still waiting.
 //
 //   flowing --no responders, no acknowledgement, connection lost--> holding
 //      ^                                                            |     ^
@@ -42,15 +42,16 @@ struct OutgoingMessage {
 //            lets all later unacknowledged messages follow in order, and then the queue.
 //
 // Why one probe first: while a cluster elects a leader, it drops some messages and stores others.
-// Without the probe, a later message would overtake an earlier one. The stream uses the identifier
-// to recognise a message that it already has, and acknowledges the message without storing it
-// twice. This keeps the order of a session's messages even when the leader of the stream is lost.
-// One exception: if the leader changes faster than a message travels to the server and back, a
-// later message can be stored before an earlier one.
+// Without the probe, a later message would overtake an earlier one. If the stream already has a
+// message that is published again, it recognises the message's identifier, and acknowledges the
+// message without storing it twice. This keeps the order of a session's messages even if the stream
+// loses its leader. There is one exception: if the leader changes faster than a message travels to
+// the server and back, a later message can be stored before an earlier one.
 //
 // A probe without a response can mean that the stream was deleted or that its server lost its
-// files. The publisher then creates the stream again. A message without an acknowledgement within
-// kAckTime of its first attempt is abandoned and counted as not acknowledged.
+// files. The publisher then looks for the stream, and creates it again if it does not exist. A
+// message without an acknowledgement within kAckTime of its first attempt is abandoned and counted
+// as not acknowledged.
 //
 // Threads: any, except for the functions from attach() to detach(), which are for the link's
 // thread. A thread of the library calls onAcknowledged(). Only the link's thread ever waits for a
@@ -63,15 +64,15 @@ class NatsPublisher {
   using Time = std::chrono::steady_clock::time_point;
 
   // Long enough for a cluster to elect a leader, and for most restarts of a server. At most half of
-  // the time for which the stream recognises identifiers, see NatsStream.cpp.
+  // the time for which the stream recognises identifiers; see NatsStream.cpp.
   static constexpr std::chrono::seconds kAckTime{30};
   // The pause between two probes. Short compared with an election, which takes seconds.
   static constexpr std::chrono::milliseconds kResendPause{100};
   // The pause between two lookups of the stream. A lookup costs a cluster more than a probe.
   static constexpr std::chrono::seconds kStreamCheckPause{2};
-  // The bytes that may wait while servers are away: as many as the largest request of a client has,
-  // or about 37,000 ordinary messages of 886 bytes with headers. A larger queue would delay the
-  // error by which a session learns that the link is broken.
+  // The bytes that may wait while no server is connected. This is the size of the largest request
+  // of a client, and of about 37,000 ordinary messages (886 bytes with headers). With a larger
+  // queue, a session would get the error of a broken link later.
   static constexpr std::size_t kQueueBytes = 32U << 20U;
 
   // `wake` makes the link's thread look for work again.
@@ -81,28 +82,29 @@ class NatsPublisher {
   NatsPublisher& operator=(const NatsPublisher&) = delete;
   ~NatsPublisher() = default;
 
-  // Counts a message that a session sends, before it is queued or refused.
+  // Counts a message that a session sends. Call it before the message is queued or refused.
   void countReceived() { received_.add(); }
   // Queues the message and moves from it. If the queue is full, returns the error and leaves
   // `message` unchanged.
   [[nodiscard]] std::optional<Error> take(OutgoingMessage& message) HALVOX_EXCLUDES(mutex_);
-  // Accounts for a message that was not queued; its sender gets the error.
+  // Counts a message that was not queued. Its sender gets the error from the caller.
   void refuse(const OutgoingMessage& message);
-  // After this call, the last pending acknowledgement also calls `wake`. It does not do so before:
-  // with little traffic, every acknowledgement is the last one and would wake the thread for
-  // nothing.
+  // After this call, the last pending acknowledgement also calls `wake`. Before it, it does not:
+  // with little traffic, every acknowledgement is the last pending one and would wake the thread
+  // for nothing.
   void beginEnd() HALVOX_EXCLUDES(mutex_);
-  // Abandons everything, queued or unacknowledged.
+  // Abandons all queued and all unacknowledged messages.
   void abandonAll() HALVOX_EXCLUDES(mutex_);
 
   [[nodiscard]] bool hasQueued() HALVOX_EXCLUDES(mutex_);
-  // Whether nothing is queued and nothing awaits its acknowledgement.
+  // Returns true if no message is queued or waits for its acknowledgement.
   [[nodiscard]] bool isDone() HALVOX_EXCLUDES(mutex_);
-  // When the oldest unacknowledged message is abandoned; none without such a message.
+  // Returns the time when the oldest unacknowledged message will be abandoned; std::nullopt if
+  // there is none.
   [[nodiscard]] std::optional<Time> firstDeadline() HALVOX_EXCLUDES(mutex_);
-  // When the next probe is due; none unless holding.
+  // Returns the time when the next probe is due; std::nullopt unless the publisher is holding.
   [[nodiscard]] std::optional<Time> probeTime() HALVOX_EXCLUDES(mutex_);
-  // Whether publishNext() would publish, provided that a server is connected.
+  // Returns true if publishNext() would publish now, provided that a server is connected.
   [[nodiscard]] bool canPublish(Time now) HALVOX_EXCLUDES(mutex_);
 
   // The functions from here to detach() are for the link's thread only.
@@ -111,15 +113,16 @@ class NatsPublisher {
   void attach(jsCtx* context, std::chrono::nanoseconds duplicates);
   void publishNext() HALVOX_EXCLUDES(mutex_);
   void abandonOverdue() HALVOX_EXCLUDES(mutex_);
-  // Fails all queued messages, for example because no server could be reached.
+  // Counts all queued messages as failed, for example because no server could be reached.
   void failQueued(std::string_view reason) HALVOX_EXCLUDES(mutex_);
-  // The connection has ended: abandons all unacknowledged messages. The queue stays for the next
-  // connection.
+  // Call it when the connection has ended. Abandons all unacknowledged messages. Queued messages
+  // stay for the next connection.
   void detach() HALVOX_EXCLUDES(mutex_);
 
-  // Any thread. The connection was lost: unacknowledged messages have to be published again.
+  // Any thread. Call it when the connection was lost. Unacknowledged messages will then be
+  // published again, before new ones.
   void holdAfterLoss() HALVOX_EXCLUDES(mutex_);
-  // The handler for the options of the library; `publisher` points to this object.
+  // The library calls this function for each acknowledgement. `publisher` points to this object.
   static void onAcknowledged(jsCtx* context, natsMsg* message, jsPubAck* ack, jsPubAckErr* error,
                              void* publisher);
 
@@ -146,7 +149,7 @@ class NatsPublisher {
       HALVOX_EXCLUDES(mutex_);
   [[nodiscard]] std::deque<OutgoingMessage> takeQueue() HALVOX_REQUIRES(mutex_);
 
-  const Configuration::Link& options_;  // the owner's
+  const Configuration::Link& options_;  // owned by the NatsLink
   StatisticsService& statistics_;
   const std::function<void()> wake_;
   Counter& received_;
@@ -156,7 +159,7 @@ class NatsPublisher {
 
   Mutex mutex_;
   Flow flow_ HALVOX_GUARDED_BY(mutex_) = Flow::kFlowing;
-  Time probeAt_ HALVOX_GUARDED_BY(mutex_){};  // while holding
+  Time probeAt_ HALVOX_GUARDED_BY(mutex_){};  // used while holding
   bool isWindowFull_ HALVOX_GUARDED_BY(mutex_) = false;
   bool isStreamInDoubt_ HALVOX_GUARDED_BY(mutex_) = false;
   bool isEnding_ HALVOX_GUARDED_BY(mutex_) = false;
@@ -173,7 +176,7 @@ class NatsPublisher {
   BurstLog streamLog_;
 };
 
-// The error that a sender gets for a message that the link does not take.
+// Returns the error for the sender of a message that the link refuses.
 [[nodiscard]] Error refusedByLink(std::string description);
 
 }  // namespace halvox::platform::linux_

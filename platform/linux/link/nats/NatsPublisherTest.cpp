@@ -23,7 +23,7 @@ class NatsPublisherTest : public testing::Test {
   std::uint64_t counted(std::string_view name) {
     return statistics_.counter("link to NATS", name).value();
   }
-  // The tally of a flush of all messages so far; none if it still waits.
+  // Returns the tally of a flush of all messages so far; std::nullopt if the flush still waits.
   std::optional<AckTally> flushed() {
     std::optional<AckTally> tally;
     ledger_->flush([&tally](const AckTally& reported) { tally = reported; });

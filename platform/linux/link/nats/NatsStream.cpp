@@ -8,14 +8,14 @@ namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsLink");
 
-// The limits of a stream that this service creates. A reader can be absent for a month; 4 GiB
+// The limits of a stream that this service creates. A reader can be absent for a month. 4 GiB
 // bounds the disk space that a busy service uses on the server in that time.
 constexpr std::int64_t kStreamBytes = std::int64_t{4} << 30;
 constexpr std::chrono::nanoseconds kStreamAge = std::chrono::hours(24 * 30);
 
-// The stream recognises a message identifier for this long. A message is published again for at
-// most half of this time: the last copy can arrive later, and the stream must still recognise its
-// identifier. Two minutes is also the default of the server.
+// For this long the stream recognises a message identifier. A message is published again for at
+// most half of this time, because the last copy can arrive late and the stream must still recognise
+// its identifier. Two minutes is also the default of the server.
 constexpr std::chrono::nanoseconds kDuplicatesTime = std::chrono::minutes(2);
 static_assert(kDuplicatesTime >= 2 * NatsPublisher::kAckTime);
 
@@ -40,8 +40,8 @@ StreamProvision provideStream(jsCtx* context, const Configuration::Link& options
     provision.duplicates = std::chrono::nanoseconds(info.get()->Config->Duplicates);
     return provision;
   }
-  // Create the stream only if it is known not to exist. Other failures do not show whether it
-  // exists.
+  // Create the stream only if the server says that it does not exist. Other failures do not show
+  // whether it exists.
   if (status != NATS_NOT_FOUND && code != JSStreamNotFoundErr) {
     provision.failure = "cannot look up stream " + options.stream + ": " + describe(status);
     return provision;
@@ -60,7 +60,7 @@ StreamProvision provideStream(jsCtx* context, const Configuration::Link& options
   stream.Duplicates = kDuplicatesTime.count();
   status = js_AddStream(info.out(), context, &stream, nullptr, &code);
   if (status == NATS_OK) kLog.notice("created the NATS stream ", options.stream);
-  // Another service may have created it since the lookup.
+  // Another service may have created the stream since the lookup. That is not a failure.
   if (status != NATS_OK && code != JSStreamNameExistErr) {
     provision.failure = "cannot create stream " + options.stream + ": " + describe(status);
   }

@@ -8,18 +8,19 @@
 
 namespace halvox::platform::linux_ {
 
-// The text of a status, and the client library's detail about the last failure on this thread.
+// Returns the text of a status, with the client library's details of the last failure on this
+// thread.
 [[nodiscard]] std::string describe(natsStatus status);
 
-// What is known of the stream after provideStream().
+// The result of provideStream().
 struct StreamProvision {
   std::string failure;                    // empty on success
   std::chrono::nanoseconds duplicates{};  // how long the stream recognises a message identifier
 };
 
-// Finds the stream, or creates it if no server knows it. A stream that exists keeps its limits: an
-// operator who wants limits other than ours creates it first. Blocks for up to two requests of
-// the context's time-out.
+// Finds the stream, or creates it if it does not exist. A stream that exists keeps its limits. An
+// operator who wants other limits than ours can therefore create the stream first. Blocks for up to
+// two requests, each for at most the time-out of the context.
 [[nodiscard]] StreamProvision provideStream(jsCtx* context, const Configuration::Link& options);
 
 }  // namespace halvox::platform::linux_

@@ -21,14 +21,14 @@ class NatsTlmReporting : public TLMReportingService {
   // Refuses further messages, publishes the accepted ones for up to 3 seconds, calls back all
   // callers that still wait, and ends the connection. Blocks for at most about 10 seconds. Call it
   // when no other thread uses the back-end. Returns false if a thread still waits for a server,
-  // which the NATS client library cannot interrupt: the environment must then stay until the
-  // process ends.
+  // because the NATS client library cannot interrupt that. The environment must then exist until
+  // the process ends.
   [[nodiscard]] virtual bool close() = 0;
 };
 
-// Makes the back-end. It connects when the first session starts: a service whose sessions never
-// start needs no server. Call it only in the module and in programs that link the module's code;
-// the service uses loadNatsTlmReporting().
+// Makes the back-end. It connects when the first session starts, because a service whose sessions
+// never start needs no server. Call this function only in the module and in programs that link the
+// module's code; the service calls loadNatsTlmReporting().
 [[nodiscard]] std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(
     Configuration::Link options, const NatsEnvironment& environment);
 

@@ -16,10 +16,11 @@ namespace {
 
 constexpr UnitLog kLog(natsLogCategory, "NatsTlmReportingService");
 constexpr const char* kMessageIdHeader = "Nats-Msg-Id";
-// Roughly what the header adds to a message. Servers count it as part of the message's size.
+// About how many bytes the header adds to a message. Servers count the header as part of the
+// message's size.
 constexpr std::size_t kHeaderBytes = 80;
 
-// One for each thread, because it reuses its buffer.
+// Each thread has its own encoder, because an encoder reuses its buffer.
 PayloadEncoder& encoder() {
   thread_local PayloadEncoder encoder;
   return encoder;
@@ -54,14 +55,15 @@ std::unique_ptr<NatsTlmReporting> makeNatsTlmReporting(Configuration::Link optio
   return std::make_unique<NatsTlmReportingService>(std::move(options), environment);
 }
 
-// A session: what all its messages have in common, encoded once. Immutable except for its ledger.
+// The data that all messages of one session have in common, encoded once. Immutable except for the
+// ledger.
 class NatsTlmReportingService::LinkedSession final : public TLMReportingSession {
  public:
   LinkedSession(const std::string& subject, const Dictionary& sessionInfo,
                 const Dictionary& userInfo)
       : id_(sessionIdOf(sessionInfo)) {
-    // Clients set the service name in their configuration, and may set a value that is not a
-    // string.
+    // The service name comes from a client's configuration and may be a value that is not a string.
+    // It then counts as empty.
     const Value* const service = userInfo.find(kTLMReportingUserInfoServiceName);
     const std::string_view name = service == nullptr ? std::string_view() : service->string();
     subject_ = subject + "." + subjectToken(name) + "." + id_;
@@ -127,7 +129,8 @@ TLMReportingOutcome NatsTlmReportingService::TLMReportingSendOneMessage(
 TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
                                                   const TLMReportingMessage& message) {
   if (auto ending = link_->refuseAtEnd()) return {.sent = false, .error = std::move(ending)};
-  // Encode here, on the session's queue: one thread serves the link of all sessions.
+  // Encode here, on the session's queue and not on the link's thread, because that one thread
+  // serves all sessions.
   const std::string_view payload = encoder().encode(message.payload);
   std::string body;
   body.reserve(session.beginning().size() + payload.size() + 48);
@@ -138,8 +141,8 @@ TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
   body += R"(,"payload":)";
   body += payload;
   body += '}';
-  // The identifier is the same at each attempt, so that the stream recognises a message that it
-  // already has. The random part keeps a restarted service from using numbers again.
+  // The identifier is the same at each attempt. The stream therefore recognises a message that it
+  // already has. Because of the random part, a restarted service does not use an identifier again.
   std::string id = instance_ + "-";
   append(id, lastMessage_.fetch_add(1, std::memory_order_relaxed) + 1);
 
@@ -154,7 +157,8 @@ TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
   }
   outgoing.bytes = body.size() + kHeaderBytes;
   outgoing.ledger = session.ledger();
-  // Add it before sending the message, whose acknowledgement may arrive before send() returns.
+  // Add the message to the ledger before sending it, because its acknowledgement may arrive before
+  // send() returns.
   if (outgoing.ledger) outgoing.number = outgoing.ledger->add();
   std::optional<Error> error = link_->send(std::move(outgoing));
   const bool sent = !error.has_value();
@@ -165,7 +169,7 @@ void NatsTlmReportingService::TLMReportingFlushMessages(const Session& session,
                                                         std::function<void()> flushed) {
   const auto linked = std::static_pointer_cast<LinkedSession>(session);
   const std::shared_ptr<AckLedger>& ledger = linked->ledger();
-  // A session that does not batch waits for no acknowledgement.
+  // A session that does not batch does not wait for acknowledgements.
   if (!ledger) return flushed();
   const AckLedger::FlushId flush = ledger->flush(
       [name = linked->subject(), flushed = std::move(flushed)](const AckTally& tally) {
@@ -178,7 +182,8 @@ void NatsTlmReportingService::TLMReportingFlushMessages(const Session& session,
         flushed();
       });
   if (flush == 0) return;
-  // The job holds a weak reference: a flush that ended in time must not keep its session's account.
+  // The job holds a weak reference, because it must not keep the ledger alive if the flush has
+  // ended in time.
   dispatch_.asyncAfterOnBackgroundQueue(kFlushTime, [ledger = std::weak_ptr(ledger), flush] {
     if (const auto held = ledger.lock()) held->giveUp(flush);
   });

@@ -14,15 +14,15 @@ namespace halvox::platform::linux_ {
 //
 // and publishes it on the subject <subject>.<service name>.<session ID>, with an identifier by
 // which the stream recognises a second copy. A flush of a session that batches waits for the
-// acknowledgements of its messages, but no longer than kFlushTime. Other sessions have no flush;
-// their acknowledgements are only counted.
-// Threads: any, as the port says; only close() blocks.
-// Failures: a message that cannot be accepted is answered with an error; see NatsLink for what
-// happens to accepted messages.
+// acknowledgements of its messages, but no longer than kFlushTime. A flush of any other session
+// ends at once; the acknowledgements of its messages are only counted.
+// Threads: any, as the port requires; only close() blocks.
+// Failures: a message that cannot be accepted is answered with an error. NatsLink says what happens
+// to accepted messages.
 class NatsTlmReportingService final : public NatsTlmReporting {
  public:
-  // Long enough for a second attempt to publish, see NatsPublisher. After it, the flush reports how
-  // many messages are not acknowledged.
+  // Long enough for a second attempt to publish; see NatsPublisher. After this time, the flush
+  // reports how many messages are not acknowledged.
   static constexpr std::chrono::seconds kFlushTime{5};
 
   NatsTlmReportingService(Configuration::Link options, const NatsEnvironment& environment);
@@ -48,7 +48,7 @@ class NatsTlmReportingService final : public NatsTlmReporting {
   const std::string subject_;
   const std::string instance_;  // random, unique to this run of the service
   DispatchService& dispatch_;
-  std::atomic<std::uint64_t> lastToken_{0};  // orders no other memory; nor does the next
+  std::atomic<std::uint64_t> lastToken_{0};  // both are relaxed: they order no other memory
   std::atomic<std::uint64_t> lastMessage_{0};
   const std::shared_ptr<NatsLink> link_;  // shared with delayed jobs of the link
 };

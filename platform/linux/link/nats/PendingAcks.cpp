@@ -26,7 +26,8 @@ PendingAcks::Entry PendingAcks::settle(Slot& slot) {
   return std::move(slot.entry);
 }
 
-// Restores two invariants: the first slot is unsettled, and so is the next one to publish again.
+// Restores two invariants: the first slot is unsettled, and the next slot to publish again is
+// unsettled.
 void PendingAcks::skipSettled() {
   while (!slots_.empty() && slots_.front().isSettled) {
     slots_.pop_front();
@@ -68,7 +69,7 @@ NatsMessage PendingAcks::nextAgain() {
 
 std::vector<PendingAcks::Entry> PendingAcks::takeOverdue(Time now) {
   std::vector<Entry> overdue;
-  // Only the oldest is checked: a later message never has an earlier deadline.
+  // Check only the oldest message, because a later message never has an earlier deadline.
   while (!slots_.empty() && slots_.front().entry.deadline <= now) {
     overdue.push_back(settle(slots_.front()));
     skipSettled();

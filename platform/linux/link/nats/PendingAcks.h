@@ -14,21 +14,22 @@
 
 namespace halvox::platform::linux_ {
 
-// How much may be published and not yet acknowledged. It bounds what must be published again after
-// a failure, and what the client library holds in addition to our queue.
+// How much may be published and not yet acknowledged. It bounds how much must be published again
+// after a failure, and how much memory the client library needs in addition to our queue.
 struct AckWindow {
   std::size_t messages = 8192;
   std::size_t bytes = 16U << 20U;
 };
 
 // The messages that were published and are not yet acknowledged, in the order of their first
-// attempts. A message is either in the client library, which reports about it by its address, or
-// was given back and is held here for another attempt. Both kinds count in the window.
+// attempts. A message is either in the client library, which will report its outcome and identifies
+// it by its address, or the library has returned it and it is held here for another attempt. Both
+// count in the window.
 //
 // After a failure, beginAgain() goes back to the oldest message, and each nextAgain() returns one
-// message to publish again. Nothing new may be added before needsAgain() is false; this keeps the
-// order.
-// Not thread-safe: the owner locks.
+// message to publish again. To keep the order, no new message may be added before needsAgain() is
+// false.
+// Not thread-safe; the owner must hold a lock.
 class PendingAcks {
  public:
   using Time = std::chrono::steady_clock::time_point;
@@ -36,35 +37,37 @@ class PendingAcks {
     std::shared_ptr<AckLedger> ledger;  // null when no flush waits for it
     AckLedger::Number number = 0;
     std::size_t bytes = 0;
-    Time deadline;  // not before that of an older message
+    Time deadline;  // never earlier than that of an older message
   };
 
   explicit PendingAcks(AckWindow window) : window_(window) {}
 
-  // Whether one more message may be published. Its size does not matter: otherwise a message larger
-  // than the window could never be published.
+  // Returns true if one more message of any size may be published. If its size counted, a message
+  // larger than the window could never be published.
   [[nodiscard]] bool hasRoom() const { return size_ < window_.messages && bytes_ < window_.bytes; }
-  // Whether half of the window is free. The publisher waits for this after the window was full:
-  // waking it for each acknowledgement would cost more than publishing.
+  // Returns true if half of the window is free. The publisher waits for this after the window was
+  // full, because waking it for each acknowledgement would cost more than publishing.
   [[nodiscard]] bool isHalfFree() const {
     return size_ <= window_.messages / 2 && bytes_ <= window_.bytes / 2;
   }
   [[nodiscard]] std::size_t size() const { return size_; }
-  // When the oldest message is overdue; none without messages.
+  // Returns the deadline of the oldest message; std::nullopt if there is none.
   [[nodiscard]] std::optional<Time> firstDeadline() const;
 
   // Call only while needsAgain() is false.
   void add(const natsMsg* message, Entry entry);
-  // Removes a message that the library has reported about; returns none if it was already overdue.
+  // Removes a message whose outcome the library has reported. Returns std::nullopt if it was
+  // removed before as overdue.
   std::optional<Entry> take(const natsMsg* message);
-  // Holds a message that the library gave back. Returns false if it was already overdue.
+  // Holds a message that the library has returned. Returns false if it was removed before as
+  // overdue.
   bool giveBack(NatsMessage message);
 
   void beginAgain() { again_ = first_; }
-  // Whether messages must be published again before anything new.
+  // Returns true if messages must be published again before any new message.
   [[nodiscard]] bool needsAgain() const { return again_ < first_ + slots_.size(); }
-  // Whether the next message to publish again is held here. If it is not, the library will report
-  // about it.
+  // Returns true if the next message to publish again is held here. If it is not, the library has
+  // it and will report its outcome.
   [[nodiscard]] bool hasAgain() const { return needsAgain() && slots_[again_ - first_].held; }
   // Removes and returns the next message to publish again. Publish it at once. Call only if
   // hasAgain().
@@ -87,7 +90,7 @@ class PendingAcks {
   const AckWindow window_;
   std::deque<Slot> slots_;
   std::uint64_t first_ = 0;  // number of the first slot
-  std::uint64_t again_ = 0;  // number of the next to publish again; one past the last if none
+  std::uint64_t again_ = 0;  // number of the next slot to publish again; one past the last if none
   std::unordered_map<const natsMsg*, std::uint64_t> atLibrary_;
   std::size_t size_ = 0;   // of unsettled slots
   std::size_t bytes_ = 0;  // of unsettled slots

@@ -21,11 +21,11 @@ Time at(int seconds) { return Time(std::chrono::seconds(seconds)); }
 
 class PendingAcksTest : public ::testing::Test {
  protected:
-  // The library must be open before messages are created.
+  // Open the library, because messages cannot be created before.
   static void SetUpTestSuite() { ASSERT_EQ(nats_Open(-1), NATS_OK); }
   static void TearDownTestSuite() { EXPECT_EQ(nats_CloseAndWait(5000), NATS_OK); }
 
-  // Adds a message that the library has.
+  // Adds a message that was passed to the library.
   const natsMsg* add(NatsMessage& message, Time deadline = Time::max()) {
     pending.add(message.get(), entryOf(1, deadline));
     return message.get();

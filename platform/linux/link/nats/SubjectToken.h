@@ -5,8 +5,9 @@
 
 namespace halvox::platform::linux_ {
 
-// The longest token made from a client's text, in bytes. If a line of the NATS protocol is too long
-// (over 4,096 bytes by default), the server closes the connection, which all sessions share.
+// The longest token made from a client's text, in bytes. It is bounded because the server closes
+// the connection, which all sessions share, if a line of the NATS protocol is too long (over 4,096
+// bytes by default).
 inline constexpr std::size_t kLongestSubjectToken = 128;
 
 // Makes one token of a subject from a text that a client may have chosen. A client must not be able

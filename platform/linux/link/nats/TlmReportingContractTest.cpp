@@ -43,7 +43,7 @@ sockaddr_in loopback(int port) {
   return address;
 }
 
-// A loopback port that was free a moment ago.
+// Returns a loopback port that was free a moment ago.
 int freePort() {
   const UniqueFd socket(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
   sockaddr_in address = loopback(0);
@@ -61,7 +61,7 @@ bool accepts(int port) {
 }
 
 // One nats-server with JetStream in a scratch directory, for all tests of this program. The kernel
-// kills it when the program ends, however it ends.
+// kills the server when the program ends, even if the program is killed.
 class NatsServer {
  public:
   // Null if nats-server is not installed or does not start.
@@ -109,7 +109,8 @@ class NatsServer {
   bool isUp_ = false;
 };
 
-// The other services. Never destroyed: the back-end keeps a reference to its log category.
+// The other services. They are never destroyed, because the back-end keeps a reference to its log
+// category.
 FakePlatform& neighbours() {
   static auto* const platform = new FakePlatform;
   return *platform;

@@ -1,6 +1,6 @@
-// Prints what a stream holds, one JSON object a line:
-// {"subject":…,"sequence":…,"id":…,"message":…}. An independent subscriber: it shares no code with
-// the back-end that it checks, except the handles.
+// Prints the messages of a stream, one JSON object a line:
+// {"subject":…,"sequence":…,"id":…,"message":…}. An independent subscriber. Except for the handles,
+// it shares no code with the back-end that it checks.
 //
 //   halvox_stream_reader URL STREAM
 #include <cstdint>
