@@ -40,6 +40,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
   const auto cycles = pipewire::decodeProfile(pod);
   for (const auto& cycle : cycles) {
     if (!(cycle.length.count() > 0) || cycle.late.size() > cycle.followers.size()) std::abort();
+    if (cycle.quantum <= 0 || cycle.rate < 0) std::abort();
     for (const auto& node : cycle.followers) {
       if (node.wait.has_value() && node.wait->count() < 0) std::abort();
       if (node.busy.has_value() && (node.busy->count() < 0 || !node.wait.has_value())) std::abort();

@@ -1,6 +1,8 @@
 #include "platform/linux/pipewire/ProfileDecoder.h"
 
+#include <cmath>
 #include <optional>
+#include <string_view>
 #include <utility>
 
 #include <spa/param/profiler.h>
@@ -12,6 +14,7 @@ namespace {
 
 // The stages of a node's work in a cycle, as the profiler numbers them. A node that has not been
 // called is not late itself, but waits for another node that is late.
+constexpr std::int32_t kWaiting = 0;
 constexpr std::int32_t kCalled = 1;
 constexpr std::int32_t kAwake = 2;
 constexpr std::int32_t kFinished = 3;
@@ -32,17 +35,22 @@ bool readClock(const spa_pod& value, ProfiledCycle& cycle) {
                            SPA_POD_Int(&flags), SPA_POD_Int(&id), SPA_POD_String(&name),  //
                            SPA_POD_Long(&time), SPA_POD_Fraction(&rate),                  //
                            SPA_POD_Long(&position), SPA_POD_Long(&duration)) < 0 ||
-      rate.denom == 0) {
+      rate.num == 0 || rate.denom == 0) {
     return false;
   }
   cycle.time = std::chrono::nanoseconds(time);
   cycle.length =
       std::chrono::duration<double>(static_cast<double>(duration) * rate.num / rate.denom);
+  cycle.quantum = duration;
+  // The clock has the length of one frame, such as 1/48000.
+  cycle.rate = std::lround(static_cast<double>(rate.denom) / rate.num);
   return cycle.length.count() > 0 && cycle.length <= kLongestCycle;
 }
 
+// `name` belongs to the event.
 struct ReadNode {
   ProfiledNode node;
+  std::string_view name{};
   std::int32_t stage = 0;
 };
 
@@ -60,7 +68,10 @@ std::optional<ReadNode> readNode(const spa_pod& value) {
                            SPA_POD_Long(&awake), SPA_POD_Long(&finish), SPA_POD_Int(&stage)) < 0) {
     return std::nullopt;
   }
-  ReadNode read{.node = {.id = static_cast<std::uint32_t>(id)}, .stage = stage};
+  ReadNode read{.node = {.id = static_cast<std::uint32_t>(id)},
+                // A node may have no name.
+                .name = name == nullptr ? std::string_view() : name,
+                .stage = stage};
   // A stage that was not reached has the time of an earlier cycle, or none, which is 0. Requiring
   // positive times also keeps the differences from overflowing.
   if (signal > 0 && awake >= signal && stage >= kAwake) {
@@ -73,9 +84,17 @@ std::optional<ReadNode> readNode(const spa_pod& value) {
 }
 
 void addFollower(const ReadNode& read, ProfiledCycle& cycle) {
+  if (read.stage == kWaiting) cycle.waiting.push_back(read.node.id);
   if (read.stage < kCalled || read.stage > kFinished) return;
   cycle.followers.push_back(read.node);
-  if (read.stage < kFinished) cycle.late.push_back(read.node.id);
+  if (read.stage < kFinished) {
+    cycle.late.push_back({.id = read.node.id, .name = std::string(read.name)});
+  }
+}
+
+void setDriver(const ReadNode& read, ProfiledCycle& cycle) {
+  cycle.driver = read.node;
+  cycle.driverName = read.name;
 }
 
 // Reads the count of xruns, which is the last of the load figures. The others are not used.
@@ -103,7 +122,7 @@ std::optional<ProfiledCycle> readCycle(const spa_pod* pod) {
     } else if (prop->key == SPA_PROFILER_clock) {
       hasClock = readClock(prop->value, cycle);
     } else if (prop->key == SPA_PROFILER_driverBlock) {
-      if (const auto read = readNode(prop->value)) cycle.driver = read->node;
+      if (const auto read = readNode(prop->value)) setDriver(*read, cycle);
     } else if (prop->key == SPA_PROFILER_followerBlock) {
       if (const auto read = readNode(prop->value)) addFollower(*read, cycle);
     }

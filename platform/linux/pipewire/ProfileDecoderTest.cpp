@@ -20,6 +20,7 @@ class ProfileDecoderTest : public testing::Test {
     int id;
     int status;
     std::int64_t awake = 50;
+    const char* name = "node";
   };
   struct Cycle {
     std::int64_t time = 0;
@@ -49,7 +50,7 @@ class ProfileDecoderTest : public testing::Test {
                                SPA_POD_Long(std::int64_t{4711}), SPA_POD_Long(cycle.duration),
                                SPA_POD_Long(std::int64_t{0}), SPA_POD_Double(1.0),
                                SPA_POD_Long(std::int64_t{0}));
-    addNode(SPA_PROFILER_driverBlock, {30, 3});
+    addNode(SPA_PROFILER_driverBlock, {30, 3, 50, "speakers"});
     for (const Follower& follower : cycle.followers) {
       addNode(SPA_PROFILER_followerBlock, follower);
     }
@@ -58,7 +59,7 @@ class ProfileDecoderTest : public testing::Test {
   void addNode(std::uint32_t key, const Follower& node) {
     const spa_fraction latency{1024, 48000};
     spa_pod_builder_prop(&builder_, key, 0);
-    spa_pod_builder_add_struct(&builder_, SPA_POD_Int(node.id), SPA_POD_String("node"),
+    spa_pod_builder_add_struct(&builder_, SPA_POD_Int(node.id), SPA_POD_String(node.name),
                                SPA_POD_Long(std::int64_t{10}), SPA_POD_Long(std::int64_t{20}),
                                SPA_POD_Long(node.awake), SPA_POD_Long(std::int64_t{120}),  //
                                SPA_POD_Int(node.status), SPA_POD_Fraction(&latency));
@@ -80,12 +81,44 @@ TEST_F(ProfileDecoderTest, ACycleHasTheTimeAndLengthOfItsClock) {
   EXPECT_DOUBLE_EQ(cycles[1].length.count(), 0.01);
 }
 
+TEST_F(ProfileDecoderTest, ACycleHasTheQuantumAndRateOfItsClock) {
+  const auto cycles = decodeProfile(makeProfile({{.duration = 2048, .rate = {1, 48000}},
+                                                 {.duration = 441, .rate = {1, 44100}},
+                                                 {.duration = 10, .rate = {1001, 48000}}}));
+
+  ASSERT_EQ(cycles.size(), 3U);
+  EXPECT_EQ(cycles[0].quantum, 2048);
+  EXPECT_EQ(cycles[0].rate, 48000);
+  EXPECT_EQ(cycles[1].quantum, 441);
+  EXPECT_EQ(cycles[1].rate, 44100);
+  EXPECT_EQ(cycles[2].rate, 48);
+}
+
 TEST_F(ProfileDecoderTest, NodesThatWereCalledAndDidNotFinishAreLate) {
   const auto cycles =
       decodeProfile(makeProfile({{.followers = {{40, 0}, {41, 1}, {42, 2}, {43, 3}, {44, 9}}}}));
 
   ASSERT_EQ(cycles.size(), 1U);
-  EXPECT_EQ(cycles[0].late, (std::vector<std::uint32_t>{41, 42}));
+  EXPECT_EQ(cycles[0].late, (std::vector<ProfiledLateNode>{{.id = 41, .name = "node"},
+                                                           {.id = 42, .name = "node"}}));
+}
+
+TEST_F(ProfileDecoderTest, LateNodesAndTheDriverHaveTheirNames) {
+  const auto cycles = decodeProfile(
+      makeProfile({{.followers = {{40, 1, 50, "player"}, {41, 1, 50, ""}, {42, 1, 50, nullptr}}}}));
+
+  ASSERT_EQ(cycles.size(), 1U);
+  EXPECT_EQ(cycles[0].driverName, "speakers");
+  EXPECT_EQ(cycles[0].late,
+            (std::vector<ProfiledLateNode>{{.id = 40, .name = "player"}, {.id = 41}, {.id = 42}}));
+}
+
+TEST_F(ProfileDecoderTest, FollowersThatWereNotCalledAreWaiting) {
+  const auto cycles =
+      decodeProfile(makeProfile({{.followers = {{40, 0}, {41, 2}, {42, 3}, {43, 0}, {44, -1}}}}));
+
+  ASSERT_EQ(cycles.size(), 1U);
+  EXPECT_EQ(cycles[0].waiting, (std::vector<std::uint32_t>{40, 43}));
 }
 
 TEST_F(ProfileDecoderTest, ANodeHasTheTimesOfTheStagesThatItReached) {
@@ -127,6 +160,7 @@ TEST_F(ProfileDecoderTest, CyclesOfAnImplausibleLengthAreSkipped) {
   const auto cycles = decodeProfile(makeProfile({{.duration = 0},
                                                  {.duration = -5},
                                                  {.rate = {1, 0}},
+                                                 {.rate = {0, 48000}},
                                                  {.duration = 48000 * 11},
                                                  {.duration = 48000}}));
 

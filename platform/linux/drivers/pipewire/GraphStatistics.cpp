@@ -110,8 +110,8 @@ void GraphStatistics::cycleEnded(const pipewire::ProfiledCycle& cycle) {
   for (const pipewire::ProfiledNode& follower : cycle.followers) {
     if (auto* node = find(follower.id)) node->cycleEnded(follower);
   }
-  for (const NodeID late : cycle.late) {
-    if (auto* node = find(late)) node->xrunsHappened(1);
+  for (const pipewire::ProfiledLateNode& late : cycle.late) {
+    if (auto* node = find(late.id)) node->xrunsHappened(1);
   }
 }
 

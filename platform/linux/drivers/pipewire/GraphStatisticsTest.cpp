@@ -92,7 +92,7 @@ TEST_F(GraphStatisticsTest, ACycleThatIsReportedTwiceCountsOnceWithItsXruns) {
   graph.nodeAdded(30, "Audio/Sink", "speakers");
   graph.nodeAdded(40, "Audio/Sink", "more");
   ProfiledCycle missed = cycle(2s);
-  missed.late = {40};
+  missed.late = {{.id = 40}};
 
   graph.cycleEnded(cycle(1s));
   graph.cycleEnded(missed);
