@@ -47,5 +47,20 @@ inline constexpr const char* kIssueXrun = "xrun";
 inline constexpr const char* kNodeKey = "node";
 inline constexpr const char* kIssueClientKey = "rtaid_client";
 inline constexpr const char* kSilenceKey = "any_channel_silence_seconds";
+// The same time in milliseconds, the number of missed cycles, and the length of a cycle in frames
+// and the rate in Hz that were in force.
+inline constexpr const char* kXrunMillisecondsKey = "xrun_milliseconds";
+inline constexpr const char* kMissedCyclesKey = "missed_cycles";
+inline constexpr const char* kQuantumKey = "quantum";
+inline constexpr const char* kRateKey = "rate";
+// The device that missed the cycles, the node that was late, and what the stream was.
+inline constexpr const char* kXrunDeviceKey = "device_node_name";
+inline constexpr const char* kLateNodeKey = "late_node";
+inline constexpr const char* kLateSerialKey = "late_object_serial";
+inline constexpr const char* kLateProcessKey = "late_process";
+inline constexpr const char* kXrunRoleKey = "xrun_role";
+// The number of the session's report of missed cycles, from 1. Without it the service would
+// suppress a report that is equal to the one before, and its cycles would be lost.
+inline constexpr const char* kXrunReportKey = "xrun_report";
 
 }  // namespace halvox::pipewire_reporter

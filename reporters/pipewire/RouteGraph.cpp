@@ -52,6 +52,14 @@ Route RouteGraph::routeOf(GlobalID stream, Direction direction) const {
   return route;
 }
 
+bool RouteGraph::areLinked(GlobalID node, GlobalID other) const {
+  const auto connects = [](const PeerMap& map, GlobalID from, GlobalID peer) {
+    const auto peers = map.find(from);
+    return peers != map.end() && peers->second.contains(peer);
+  };
+  return connects(sinks_, node, other) || connects(sources_, node, other);
+}
+
 void RouteGraph::release(PeerMap& map, GlobalID from, GlobalID peer) {
   Peers& peers = map[from];
   // A stereo stream has two links to its device; the device stays until the last one is removed.

@@ -48,6 +48,8 @@ class RouteGraph {
 
   // Returns the devices that a stream plays to or records from; empty while it has none.
   [[nodiscard]] Route routeOf(GlobalID stream, Direction direction) const;
+  // Returns whether a link connects the two nodes, in either direction.
+  [[nodiscard]] bool areLinked(GlobalID node, GlobalID other) const;
 
  private:
   // The nodes at the other end, each with the number of links to it. Each channel has a link.

@@ -27,6 +27,20 @@ class RouteGraphTest : public testing::Test {
 
 using Names = std::vector<std::string>;
 
+TEST_F(RouteGraphTest, NodesAreLinkedInBothDirectionsUntilTheLastLinkIsRemoved) {
+  graph.addLink(1, {.output = kStream, .input = kSpeakers});
+  graph.addLink(2, {.output = kStream, .input = kSpeakers});
+
+  EXPECT_TRUE(graph.areLinked(kStream, kSpeakers));
+  EXPECT_TRUE(graph.areLinked(kSpeakers, kStream));
+  EXPECT_FALSE(graph.areLinked(kStream, kHeadphones));
+
+  graph.removeLink(1);
+  EXPECT_TRUE(graph.areLinked(kStream, kSpeakers));
+  graph.removeLink(2);
+  EXPECT_FALSE(graph.areLinked(kStream, kSpeakers));
+}
+
 TEST_F(RouteGraphTest, NamesADeviceOnceHoweverManyChannelsAreLinked) {
   graph.addLink(1, {.output = kStream, .input = kSpeakers});
   graph.addLink(2, {.output = kStream, .input = kSpeakers});

@@ -31,6 +31,34 @@ std::string describeRoute(const Route& route) {
   return text;
 }
 
+// Unknown values are not sent.
+void setUnlessEmpty(platform::Dictionary& message, const char* key, const std::string& text) {
+  if (!text.empty()) {
+    message.set(key, text);
+  }
+}
+
+void setUnlessZero(platform::Dictionary& message, const char* key, std::int64_t number) {
+  if (number != 0) {
+    message.set(key, number);
+  }
+}
+
+// Returns the name of a role; empty if it is unknown.
+std::string nameOf(XrunRole role) {
+  switch (role) {
+    case XrunRole::kUnknown:
+      return {};
+    case XrunRole::kCulprit:
+      return "culprit";
+    case XrunRole::kVictim:
+      return "victim";
+    case XrunRole::kDevice:
+      return "device";
+  }
+  return {};
+}
+
 platform::Array deviceNames(const Route& route) {
   std::vector<platform::Value> names;
   for (const auto& device : route.devices) {
@@ -48,7 +76,8 @@ StreamSession::StreamSession(ReportingClient& client, Identity identity,
       serviceType_(serviceTypeForRole(property(properties, kRoleProperty))),
       configuration_(makeConfiguration(properties)),
       process_(processName(properties)),
-      node_(cleanText(property(properties, kNodeProperty))) {
+      node_(cleanText(property(properties, kNodeProperty))),
+      xruns_(identity.node) {
   client_.createSession(identity_.reporterID);
   client_.setServiceType(identity_.reporterID, serviceType_);
   client_.setConfiguration(identity_.reporterID, configuration_);
@@ -121,15 +150,15 @@ void StreamSession::changeVolume(const VolumeChange& change) {
   }
 }
 
-void StreamSession::addXrun(XrunMeter::Time cycle, XrunMeter::Seconds lost) {
+void StreamSession::addXrun(const DeviceXrun& xrun) {
   if (running_) {
-    xruns_.add(cycle, lost);
+    xruns_.add(xrun);
   }
 }
 
 void StreamSession::reportXruns(XrunMeter::Time now) {
-  if (const auto lost = xruns_.takeDue(now)) {
-    sendXrun(*lost);
+  if (const auto report = xruns_.takeDue(now)) {
+    sendXrun(*report);
   }
 }
 
@@ -159,8 +188,8 @@ void StreamSession::beginRun() {
 
 void StreamSession::endRun() {
   // Sent before the Stop, because what was lost belongs to this run.
-  if (const auto lost = xruns_.takeRest()) {
-    sendXrun(*lost);
+  if (const auto report = xruns_.takeRest()) {
+    sendXrun(*report);
   }
   // Send the volume before the Stop, so that the time played at this volume ends within the run.
   sendVolumeIfChanged();
@@ -197,11 +226,22 @@ void StreamSession::sendVolumeIfChanged() {
        kCategoryVolume, kTypeState);
 }
 
-void StreamSession::sendXrun(XrunMeter::Seconds lost) {
+void StreamSession::sendXrun(const XrunReport& report) {
   platform::Dictionary issue{
-      {kIssueTypeKey, kIssueXrun}, {kNodeKey, node_}, {kSilenceKey, lost.count()}};
+      {kIssueTypeKey, kIssueXrun},        {kNodeKey, node_},
+      {kSilenceKey, report.lost.count()}, {kXrunMillisecondsKey, report.lost.count() * 1000},
+      {kMissedCyclesKey, report.cycles},  {kXrunReportKey, ++xrunReport_}};
   if (const platform::Value* application = configuration_.find(kApplicationKey)) {
     issue.set(kIssueClientKey, *application);
+  }
+  setUnlessEmpty(issue, kXrunDeviceKey, report.device);
+  setUnlessZero(issue, kQuantumKey, report.quantum);
+  setUnlessZero(issue, kRateKey, report.rate);
+  setUnlessEmpty(issue, kXrunRoleKey, nameOf(report.role));
+  setUnlessEmpty(issue, kLateNodeKey, report.late.name);
+  setUnlessEmpty(issue, kLateProcessKey, report.late.process);
+  if (report.late.serial.has_value()) {
+    issue.set(kLateSerialKey, *report.late.serial);
   }
   send(std::move(issue), category(), kTypeIssueDetector);
 }

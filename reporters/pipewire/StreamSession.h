@@ -26,6 +26,7 @@ class StreamSession {
  public:
   struct Identity {
     ReporterID reporterID = 0;
+    GlobalID node = 0;
     std::uint64_t serial = 0;
     Direction direction = Direction::kPlayback;
   };
@@ -46,15 +47,16 @@ class StreamSession {
   // Volume controls of the stream have changed. Sends the volume if it or the playing
   // state differs from the last message.
   void changeVolume(const VolumeChange& change);
-  // The stream missed the cycle that began at `cycle` and lasted `lost`. A later reportXruns()
-  // reports it.
-  void addXrun(XrunMeter::Time cycle, XrunMeter::Seconds lost);
+  // A device on which the stream ran missed cycles. A later reportXruns() reports them. Ignored
+  // while the stream does not run.
+  void addXrun(const DeviceXrun& xrun);
   // Reports what the stream has lost, at most once a second.
   void reportXruns(XrunMeter::Time now);
   // Sends format, route and volume again. For a service that restarted and has lost them.
   void restate();
 
   [[nodiscard]] Direction direction() const { return identity_.direction; }
+  [[nodiscard]] std::uint64_t serial() const { return identity_.serial; }
 
  private:
   // These send the messages with which a run begins and ends.
@@ -64,7 +66,7 @@ class StreamSession {
   void sendRoute();
   // Sends nothing while no volume is known.
   void sendVolumeIfChanged();
-  void sendXrun(XrunMeter::Seconds lost);
+  void sendXrun(const XrunReport& report);
   void sendRun(EventType type);
   void send(platform::Dictionary message, Category category, EventType type);
   [[nodiscard]] Category category() const;
@@ -89,6 +91,7 @@ class StreamSession {
   bool started_ = false;
   bool running_ = false;
   std::int64_t run_ = 0;
+  std::int64_t xrunReport_ = 0;
 };
 
 }  // namespace halvox::pipewire_reporter

@@ -1,5 +1,6 @@
 #include "reporters/pipewire/StreamTracker.h"
 
+#include <algorithm>
 #include <utility>
 
 namespace halvox::pipewire_reporter {
@@ -7,13 +8,18 @@ namespace {
 
 constexpr std::uint64_t kNamespace = 0x5057;  // "PW"; its top bit is clear, so IDs are positive
 
+// The ID of a driver that the profiler does not name. No node has it.
+constexpr GlobalID kNoNode = 0xFFFFFFFF;
+
+// Returns the name of a device, or one made from its serial if it has none.
+std::string deviceName(std::string name, std::uint64_t serial) {
+  return name.empty() ? "node-" + std::to_string(serial) : std::move(name);
+}
+
 Route::Device makeDevice(const StreamTracker::Node& node) {
   Route::Device device;
-  device.name = cleanText(property(node.properties, "node.name"));
+  device.name = deviceName(cleanText(property(node.properties, "node.name")), node.serial);
   device.description = cleanText(property(node.properties, "node.description"));
-  if (device.name.empty()) {
-    device.name = "node-" + std::to_string(node.serial);
-  }
   if (device.description.empty()) {
     device.description = device.name;
   }
@@ -45,6 +51,8 @@ void StreamTracker::serverLost() {
   streams_.clear();
   reporterIDs_.clear();
   graph_.clear();
+  nodes_.clear();
+  missed_.clear();
 }
 
 void StreamTracker::serviceRestarted() {
@@ -54,6 +62,7 @@ void StreamTracker::serviceRestarted() {
 }
 
 void StreamTracker::nodeAdded(const Node& node) {
+  nodes_.set(node.id, node.serial, node.properties);
   if (const auto direction = streamDirection(node.mediaClass)) {
     addStream(node, *direction);
     // Streams of video or MIDI are neither streams for us nor devices.
@@ -65,6 +74,8 @@ void StreamTracker::nodeAdded(const Node& node) {
 void StreamTracker::nodeRemoved(GlobalID id) {
   graph_.removeDevice(id);
   removeStream(id);
+  nodes_.remove(id);
+  missed_.forget(id);
 }
 
 void StreamTracker::linkAdded(GlobalID id, Link link) {
@@ -81,6 +92,7 @@ void StreamTracker::linkRemoved(GlobalID id) {
 
 void StreamTracker::streamPropertiesChanged(GlobalID id, const Properties& properties) {
   if (StreamSession* session = findStream(id)) {
+    nodes_.set(id, session->serial(), properties);
     session->setProperties(properties);
   }
 }
@@ -103,18 +115,67 @@ void StreamTracker::streamVolumeChanged(GlobalID id, const VolumeChange& change)
   }
 }
 
-void StreamTracker::cycleEnded(XrunMeter::Time time, XrunMeter::Seconds length,
-                               std::span<const GlobalID> lateNodes) {
-  for (const GlobalID id : lateNodes) {
-    if (StreamSession* session = findStream(id)) {
-      session->addXrun(time, length);
-    }
+void StreamTracker::cycleEnded(const pipewire::ProfiledCycle& cycle) {
+  if (const auto loss = missed_.add(cycle); loss.count > 0) {
+    addXrun(cycle, makeXrun(cycle, loss));
   }
   // At the end of every cycle, whichever nodes missed it, all reports that are due are sent. This
   // saves a timer.
   for (auto& [id, entry] : streams_) {
-    entry.session->reportXruns(time);
+    entry.session->reportXruns(cycle.time);
   }
+}
+
+DeviceXrun StreamTracker::makeXrun(const pipewire::ProfiledCycle& cycle,
+                                   const pipewire::MissedCycles::Loss& loss) const {
+  DeviceXrun xrun{.driver = kNoNode,
+                  .cycles = loss.count,
+                  .lost = loss.count * cycle.length,
+                  .quantum = cycle.quantum,
+                  .rate = cycle.rate};
+  LateNode driver;
+  if (cycle.driver.has_value()) {
+    driver = nodes_.describe(cycle.driver->id, cycle.driverName);
+    xrun.driver = driver.id;
+    xrun.device = deviceName(driver.name, driver.serial.value_or(0));
+  }
+  switch (loss.fault) {
+    case pipewire::CycleFault::kUnknown:
+      break;
+    case pipewire::CycleFault::kFollowers:
+      for (const auto& late : cycle.late) {
+        xrun.late.push_back(nodes_.describe(late.id, late.name));
+      }
+      break;
+    case pipewire::CycleFault::kDriver:
+      if (cycle.driver.has_value()) {
+        xrun.late.push_back(std::move(driver));
+      }
+      break;
+  }
+  return xrun;
+}
+
+void StreamTracker::addXrun(const pipewire::ProfiledCycle& cycle, const DeviceXrun& xrun) {
+  if (cycle.followers.empty() && cycle.waiting.empty()) {
+    for (auto& [id, entry] : streams_) {
+      if (id == xrun.driver || graph_.areLinked(id, xrun.driver)) {
+        entry.session->addXrun(xrun);
+      }
+    }
+    return;
+  }
+  const auto addTo = [&](GlobalID id) {
+    if (StreamSession* session = findStream(id)) {
+      session->addXrun(xrun);
+    }
+  };
+  // A stream can drive the graph itself, and is then not one of the followers.
+  addTo(xrun.driver);
+  for (const auto& follower : cycle.followers) {
+    addTo(follower.id);
+  }
+  std::ranges::for_each(cycle.waiting, addTo);
 }
 
 StreamSession* StreamTracker::findStream(GlobalID id) {
@@ -135,7 +196,7 @@ void StreamTracker::addStream(const Node& node, Direction direction) {
   auto session = std::make_unique<StreamSession>(
       client_,
       StreamSession::Identity{
-          .reporterID = reporterID, .serial = node.serial, .direction = direction},
+          .reporterID = reporterID, .node = node.id, .serial = node.serial, .direction = direction},
       node.properties);
   streams_.emplace(node.id, Entry{.reporterID = reporterID, .session = std::move(session)});
   // The links of a stream may have been announced before the stream itself.

@@ -3,12 +3,13 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
-#include <span>
 #include <string>
 #include <string_view>
 #include <unordered_map>
 #include <unordered_set>
 
+#include "platform/linux/pipewire/MissedCycles.h"
+#include "reporters/pipewire/NodeDirectory.h"
 #include "reporters/pipewire/ReportingClient.h"
 #include "reporters/pipewire/RouteGraph.h"
 #include "reporters/pipewire/StreamProperties.h"
@@ -58,7 +59,7 @@ class StreamTracker {
   void serviceRestarted();
 
   // A node has appeared. A stream gets a session; a device is remembered for routes. Replaces a
-  // stream that has this ID.
+  // stream that has this ID. A node that is not a stream may be added again with other properties.
   void nodeAdded(const Node& node);
   // Ends the session of a stream. Any object may be named.
   void nodeRemoved(GlobalID id);
@@ -71,9 +72,12 @@ class StreamTracker {
   void streamRunningChanged(GlobalID id, bool running);
   void streamFormatChanged(GlobalID id, const StreamFormat& format);
   void streamVolumeChanged(GlobalID id, const VolumeChange& change);
-  // A driver of the server finished a cycle of `length`, and `lateNodes` missed it.
-  void cycleEnded(XrunMeter::Time time, XrunMeter::Seconds length,
-                  std::span<const GlobalID> lateNodes);
+  // The profiler begins to report cycles. Xruns before this call were not reported.
+  void profilingBegan() { missed_.clear(); }
+  // A driver of the server ended a cycle. If it missed it, each running stream that took part has
+  // lost as much: streams that were late, and streams that suffered from it. If the profiler does
+  // not list the nodes that took part, these are the streams that are linked to the driver.
+  void cycleEnded(const pipewire::ProfiledCycle& cycle);
 
   [[nodiscard]] std::size_t streamCount() const { return streams_.size(); }
   // The number of streams that got no session, because there were too many or another stream has
@@ -85,6 +89,9 @@ class StreamTracker {
   void addStream(const Node& node, Direction direction);
   void removeStream(GlobalID id);
   void updateRoute(GlobalID id);
+  [[nodiscard]] DeviceXrun makeXrun(const pipewire::ProfiledCycle& cycle,
+                                    const pipewire::MissedCycles::Loss& loss) const;
+  void addXrun(const pipewire::ProfiledCycle& cycle, const DeviceXrun& xrun);
 
   struct Entry {
     ReporterID reporterID;
@@ -94,6 +101,8 @@ class StreamTracker {
   ReportingClient& client_;
   std::uint32_t cookie_ = 0;
   RouteGraph graph_;
+  NodeDirectory nodes_;
+  pipewire::MissedCycles missed_;
   std::unordered_map<GlobalID, Entry> streams_;
   std::unordered_set<ReporterID> reporterIDs_;
   std::uint64_t refusedStreams_ = 0;

@@ -99,6 +99,7 @@ class StreamWatcher::Impl final : public StreamListener, private pipewire::Serve
   void disconnect();
   void retryAfter(milliseconds pause);
   void addNode(GlobalID id, const Properties& properties);
+  void passNode(GlobalID id, const Properties& announced);
   void addLink(GlobalID id, const Properties& properties);
   void clientChanged(GlobalID id);
   void updateProfiler();
@@ -132,6 +133,7 @@ class StreamWatcher::Impl final : public StreamListener, private pipewire::Serve
   pipewire::UniqueContext context_;
   pipewire::ServerConnection server_;
   std::unordered_map<GlobalID, Stream> streams_;
+  std::unordered_map<GlobalID, Properties> others_;  // nodes that are not streams, as announced
   std::unordered_map<GlobalID, std::unique_ptr<ClientBinding>> clients_;
   std::optional<GlobalID> profilerID_;  // set while the server has a profiler
   std::unique_ptr<ProfilerBinding> profiler_;
@@ -162,6 +164,7 @@ void StreamWatcher::Impl::disconnect() {
   profiler_.reset();
   profilerID_.reset();
   streams_.clear();
+  others_.clear();
   clients_.clear();
   server_.disconnect();
   tracker_.serverLost();
@@ -176,10 +179,7 @@ void StreamWatcher::Impl::retryAfter(milliseconds pause) {
 
 void StreamWatcher::Impl::addNode(GlobalID id, const Properties& properties) {
   if (!streamDirection(property(properties, PW_KEY_MEDIA_CLASS))) {
-    tracker_.nodeAdded({.id = id,
-                        .serial = idProperty(properties, kSerialProperty),
-                        .mediaClass = std::string(property(properties, PW_KEY_MEDIA_CLASS)),
-                        .properties = properties});
+    passNode(id, others_.insert_or_assign(id, properties).first->second);
     return;
   }
   Stream& stream = streams_[id];
@@ -187,6 +187,14 @@ void StreamWatcher::Impl::addNode(GlobalID id, const Properties& properties) {
   stream.isKnown = false;
   stream.binding = std::make_unique<StreamBinding>(server_.registry(), id, *this);
   updateProfiler();
+}
+
+void StreamWatcher::Impl::passNode(GlobalID id, const Properties& announced) {
+  // The process of a node is a property of its client.
+  tracker_.nodeAdded({.id = id,
+                      .serial = idProperty(announced, kSerialProperty),
+                      .mediaClass = std::string(property(announced, PW_KEY_MEDIA_CLASS)),
+                      .properties = fullProperties(announced)});
 }
 
 void StreamWatcher::Impl::addLink(GlobalID id, const Properties& properties) {
@@ -200,6 +208,8 @@ void StreamWatcher::Impl::updateProfiler() {
   if (!profilerID_.has_value() || streams_.empty()) {
     profiler_.reset();
   } else if (profiler_ == nullptr) {
+    // What drivers have counted until now is not a loss of these streams.
+    tracker_.profilingBegan();
     profiler_ = std::make_unique<ProfilerBinding>(
         server_.registry(), *profilerID_, [this](const spa_pod* profile) { onProfile(profile); });
   }
@@ -207,7 +217,7 @@ void StreamWatcher::Impl::updateProfiler() {
 
 void StreamWatcher::Impl::onProfile(const spa_pod* profile) {
   for (const ProfiledCycle& cycle : pipewire::decodeProfile(profile)) {
-    tracker_.cycleEnded(cycle.time, cycle.length, cycle.late);
+    tracker_.cycleEnded(cycle);
   }
 }
 
@@ -216,6 +226,11 @@ void StreamWatcher::Impl::clientChanged(GlobalID id) {
     // The properties of a client may arrive after those of its streams.
     if (stream.isKnown && idProperty(stream.binding->properties(), kClientIDProperty) == id) {
       tracker_.streamPropertiesChanged(streamID, fullProperties(stream.binding->properties()));
+    }
+  }
+  for (const auto& [nodeID, announced] : others_) {
+    if (idProperty(announced, kClientIDProperty) == id) {
+      passNode(nodeID, announced);
     }
   }
 }
@@ -294,6 +309,7 @@ void StreamWatcher::Impl::onGlobal(const pipewire::Global& global) {
 void StreamWatcher::Impl::onGlobalRemoved(GlobalID id) {
   // The removed object can be of any kind, because the event has only its ID.
   streams_.erase(id);
+  others_.erase(id);
   clients_.erase(id);
   if (profilerID_ == id) {
     profilerID_.reset();

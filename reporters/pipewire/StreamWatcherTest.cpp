@@ -173,6 +173,11 @@ TEST_F(StreamWatcherTest, ReportsWhatAStoppedPlayerMissesWithItsLength) {
   EXPECT_EQ(client.last("playback-issue").find(kIssueClientKey)->string(), "pw-play");
   EXPECT_NEAR(silence() - before, pause.count(), 0.5);
   EXPECT_LE(std::ranges::count(client.operations(), "playback-issue") - reportsBefore, 4);
+  EXPECT_EQ(client.last("playback-issue").find(kXrunRoleKey)->string(), "culprit");
+  EXPECT_EQ(client.last("playback-issue").find(kXrunDeviceKey)->string(), "demo-speakers");
+  EXPECT_EQ(client.last("playback-issue").find(kLateNodeKey)->string(), "pw-play");
+  EXPECT_EQ(client.last("playback-issue").find(kLateProcessKey)->string(), "pw-cat");
+  EXPECT_EQ(client.last("playback-issue").find(kRateKey)->toInt64(), 48000);
 }
 
 TEST_F(StreamWatcherTest, SleepsWithoutStreamsEvenWithAProfiler) {
