@@ -47,8 +47,8 @@ enum class ProtoWireType : std::uint8_t {
 // beyond the bytes is ever read.
 class ProtoReader {
  public:
-  // The field number has 64 bits, although valid ones fit into 29: malformed bytes may contain any
-  // number.
+  // The field number has 64 bits, although valid ones fit into 29, because malformed bytes may
+  // contain any number.
   struct Tag {
     std::uint64_t number;
     ProtoWireType wireType;

@@ -41,7 +41,7 @@ std::string describeNumber(const Value& value) {
 constexpr double kEarliest = -62135596800.0;  // 0001-01-01
 constexpr double kLatest = 253402300799.0;    // 9999-12-31
 
-// Always UTC: a log line must mean the same on every machine.
+// Always UTC, because a log line must mean the same on every machine.
 std::string describeDate(Date date) {
   using namespace std::chrono;
   const double whole = std::floor(date.secondsSince1970);

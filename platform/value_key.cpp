@@ -11,7 +11,8 @@ namespace {
 using detail::KeyNode;
 
 // The number of interned keys must be bounded, because they are never freed and clients choose
-// them. Real vocabularies have a few hundred keys. Long texts are not worth a slot.
+// them. Real vocabularies have a few hundred keys. Long texts are not interned, because their
+// memory would never be freed.
 constexpr std::size_t kMaxInternedKeys = 4096;
 constexpr std::size_t kMaxInternedLength = 128;
 constexpr std::size_t kTableSlots = 4 * kMaxInternedKeys;  // at most a quarter full

@@ -87,7 +87,7 @@ class SpawnAttributes {
       ::sigemptyset(&signals);
       for (const int signal : program.blockedSignals) ::sigaddset(&signals, signal);
       ::posix_spawnattr_setsigmask(&attributes_, &signals);
-      // A signal that we ignore would be ignored by the child as well.
+      // Without this, the child would also ignore the signals that this process ignores.
       ::sigfillset(&signals);
       ::posix_spawnattr_setsigdefault(&attributes_, &signals);
       flags |= POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF;

@@ -17,8 +17,8 @@ constexpr std::uint64_t kEachHighBit = 0x8080808080808080;
 
 enum class Nul : bool { kAllowed, kRefused };
 
-// Returns true if all eight bytes are ASCII and, if a NUL is refused, none is NUL: subtracting one
-// from a NUL sets its high bit.
+// Returns true if all eight bytes are ASCII and, if a NUL is refused, none is NUL. The test for a
+// NUL subtracts one from each byte, which sets the high bit of a NUL.
 template <Nul kNul>
 bool isPlainWord(const char* bytes) {
   std::uint64_t word = 0;

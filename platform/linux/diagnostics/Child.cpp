@@ -76,7 +76,8 @@ Finding runProgram(const std::vector<std::string>& command, std::size_t most,
                                            {.number = STDOUT_FILENO, .ours = pipe->writer.get()},
                                            {.number = STDERR_FILENO}},
                            .otherDescriptors = ChildProgram::OtherDescriptors::kClosed,
-                           // One signal must reach everything that the program started.
+                           // The program gets a group of its own, so that one signal reaches
+                           // everything that it has started.
                            .group = ChildProgram::Group::kOwnGroup});
   if (!child) {
     const bool isMissing = child.error().code == ENOENT;

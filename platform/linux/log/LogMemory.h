@@ -15,9 +15,9 @@
 namespace halvox::platform::linux_ {
 
 // Keeps the newest lines of the log in memory for captures of diagnostics, at a level of its own.
-// Bounded in lines and in bytes: a new line replaces the oldest. Adding a line copies it into a
-// ring that was allocated at the start, under a short lock. Threads: any may add and read. Owner:
-// the log service.
+// Bounded in lines and in bytes. When a bound is reached, a new line replaces the oldest ones.
+// Adding a line copies it into a ring that was allocated at the start, under a short lock. Threads:
+// any may add and read. Owner: the log service.
 class LogMemory {
  public:
   struct Bounds {

@@ -39,8 +39,8 @@ Result<void*> loadModule(const Module& module, const std::filesystem::path& path
   const auto failure = [&](const std::string& why) {
     return Failure<>{std::string(module.file) + ": " + why};
   };
-  // RTLD_NOW: a symbol that the program does not have is an error here. It would otherwise end the
-  // process at the first call.
+  // With RTLD_NOW, a symbol that the program does not have is an error here. It would otherwise end
+  // the process at the first call.
   void* const library = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL | RTLD_NODELETE);
   if (library == nullptr) return failure(lastError());
   // Check the version before the entry point, because a module of another release may have an entry

@@ -13,8 +13,8 @@ namespace {
 constexpr std::uint32_t kLeaving = IN_MOVE_SELF | IN_DELETE_SELF;
 constexpr std::uint32_t kAppearing = IN_CREATE | IN_MOVED_TO;
 constexpr std::uint32_t kVanishing = IN_MOVED_FROM | IN_DELETE;
-// IN_CLOSE_WRITE and not IN_MODIFY: a save is one change, however many writes it makes. IN_ATTRIB
-// notices `touch`.
+// IN_CLOSE_WRITE and not IN_MODIFY, because a save is one change, however many writes it makes.
+// IN_ATTRIB notices `touch`.
 constexpr std::uint32_t kChanging = IN_CLOSE_WRITE | IN_ATTRIB | kAppearing | kVanishing;
 // After one of these events, some watches may be missing. All of them are then made again.
 constexpr std::uint32_t kGone = kLeaving | IN_IGNORED | IN_UNMOUNT | IN_Q_OVERFLOW;
@@ -111,8 +111,8 @@ DirectoryWatch::State DirectoryWatch::read(const OnChange& onChange) {
       next += sizeof(inotify_event) + event->len;
       if ((event->mask & kGone) != 0) state = State::kMustBeArmedAgain;
       const auto watch = watches_.find(event->wd);
-      // The event is of a watch that was removed, or about the directory itself, which kGone
-      // covers.
+      // Ignore events of a watch that was removed, and events about the directory itself, which
+      // kGone covers.
       if (watch == watches_.end() || event->len == 0) continue;
       const std::string_view file(event->name);
       if (watch->second.awaited.contains(file)) state = State::kMustBeArmedAgain;

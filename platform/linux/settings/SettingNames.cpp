@@ -5,7 +5,7 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// File names have at most 255 bytes. The rest is room for an extension and a temporary name.
+// File names have at most 255 bytes. The rest is left for an extension and a temporary name.
 constexpr std::size_t kLongestName = 200;
 constexpr std::size_t kLongestShown = 60;
 

@@ -57,8 +57,8 @@ SettingBaseline WatchedSettings::look(const std::string& name) const {
 }
 
 void WatchedSettings::add(const std::string& name, SettingBaseline&& baseline) {
-  // Note each new entry as changed, so that it is compared once, because it may have changed since
-  // the baseline was taken.
+  // Note each new entry as changed. It is then compared once, because it may have changed since the
+  // baseline was taken.
   if (names_.known.emplace(name, NotifyFile{baseline.file}).second) names_.news.insert(name);
   for (auto& [domain, values] : baseline.domains) {
     if (domains_.known.emplace(domain, std::move(values)).second) domains_.news.insert(domain);

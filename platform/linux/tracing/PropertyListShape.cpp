@@ -36,8 +36,8 @@ bool hasNulInXml(std::string_view text) {
 //
 // This is not an XML parser and need not be one, because it only has to count at least as much as
 // the library will. Anything that the library might read differently is refused, or counted in the
-// way that reaches the bounds sooner. Opening tags inside comments count, closing ones do not;
-// quotes in tags must be balanced and contain no bracket; the document type must not have
+// way that reaches the bounds sooner. Opening tags inside comments count, closing ones do not.
+// Quotes in tags must be balanced and contain no bracket. The document type must not have
 // declarations of its own.
 class XmlShape {
  public:

@@ -38,7 +38,7 @@ class GraphStatistics {
   GraphStatistics();
 
   void serverReached() { ++connections_; }
-  // The connection has ended, and with it all nodes have disappeared.
+  // The connection has ended. All nodes have disappeared with it.
   void serverLost(Time now);
   // The profiler begins to report cycles. Cycles before this call were not reported.
   void profilingBegan();

@@ -127,7 +127,7 @@ MetricLabels parseLabels(LineCursor& line) {
 
 // Returns whether a sample's name may have this suffix after the name of a family of that type.
 bool takesSuffix(MetricType type, std::string_view suffix) {
-  // The values of a histogram are those of its parts, each with a suffix.
+  // A histogram has no value without a suffix, because its values are those of its parts.
   if (suffix.empty()) return type != MetricType::kHistogram;
   switch (type) {
     case MetricType::kCounter:

@@ -22,7 +22,7 @@ using std::chrono::steady_clock;
 constexpr milliseconds kAnswersWithin{10'000};
 constexpr milliseconds kLookEvery{10};  // flock() has no time-out
 
-// A build that is not installed has the keeper beside the service's program.
+// A build that is not installed has the keeper in the directory of the service's program.
 std::string keeperPath() {
   const std::filesystem::path installed(HALVOX_TRACER_KEEPER);
   std::error_code error;
