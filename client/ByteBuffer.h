@@ -8,8 +8,8 @@
 
 namespace halvox::client {
 
-// Bytes that grow at their end, the first `kInline` of them without an allocation. The address of
-// the first byte is a multiple of 8. Belongs to one thread at a time.
+// A buffer that grows at its end. The first `kInline` bytes need no allocation. The address of the
+// first byte is a multiple of 8. Belongs to one thread at a time.
 template <std::size_t kInline>
 class ByteBuffer {
  public:
@@ -22,13 +22,13 @@ class ByteBuffer {
   [[nodiscard]] std::size_t size() const { return size_; }
   [[nodiscard]] std::span<const char> bytes() const { return {data_, size_}; }
 
-  // Returns the end of the content, after which there is room for `extra` bytes. If it throws
-  // std::bad_alloc, nothing is changed.
+  // Makes space for `extra` bytes after the content, and returns the end of the content. If it
+  // throws std::bad_alloc, the buffer is unchanged.
   char* reserve(std::size_t extra) {
     if (extra > capacity_ - size_) grow(extra);
     return data_ + size_;
   }
-  // Sets the end of the content, which must be within the reserved room.
+  // Sets the end of the content. It must be within the reserved space.
   void setEnd(const char* end) { size_ = static_cast<std::size_t>(end - data_); }
   void setSize(std::size_t size) { size_ = size; }
 

@@ -11,7 +11,8 @@ namespace {
 
 using Work = std::function<void()>;
 
-// Enough for a connection handler, which runs on this thread.
+// The size of the stack. It is enough for the program's connection handler, which runs on this
+// thread.
 constexpr std::size_t kStackBytes = std::size_t{512} * 1024;
 
 void* runWork(void* argument) {

@@ -14,21 +14,23 @@ namespace halvox::client {
 //   empty ──start()──► running ──destruction──► joined
 //                         └──────abandon()────► empty
 //
-// The owner's threads may call isCurrent() at the same time; everything else belongs to one thread.
+// Several threads of the owner may call isCurrent() at the same time. All other functions belong to
+// one thread.
 class ClientThread {
  public:
   ClientThread() = default;
-  // Waits until the work has returned.
+  // Waits until `work` has returned.
   ~ClientThread();
   ClientThread(const ClientThread&) = delete;
   ClientThread& operator=(const ClientThread&) = delete;
 
-  // Runs the work on a new thread. Call it once. Throws std::system_error if no thread can be
+  // Runs `work` on a new thread. Call it once. Throws std::system_error if no thread can be
   // started, or std::bad_alloc. `work` must not throw.
   void start(std::function<void()> work);
-  // Returns true on the thread itself, while it runs.
+  // Returns true if the calling thread is this thread.
   [[nodiscard]] bool isCurrent() const;
-  // Forgets the thread, which does not exist in a child process after fork().
+  // Call this in a child process after fork(), where the thread does not exist. The destructor then
+  // does not wait for it.
   void abandon() { isRunning_ = false; }
 
  private:

@@ -18,7 +18,8 @@ using platform::linux_::MutexLock;
 
 constexpr std::size_t kMaxWaitingOperations = 8192;
 constexpr std::chrono::seconds kFarewell{1};
-// How often to look for work if there is no descriptor through which producers can wake the thread.
+// How often to look for work if the system has no descriptor left with which producers could wake
+// the thread.
 constexpr std::chrono::milliseconds kPauseWithoutWakeUp{50};
 // While messages arrive, the worker naps instead of sleeping. A nap lasts an eighth of the time
 // since the last message, within these bounds. During the shortest nap, several messages can gather
@@ -31,11 +32,11 @@ constexpr int kNapShare = 8;
 // never has to wake this thread. A slower client wakes it for each message, and the thread then
 // wakes up 21 to 27 times by itself (measured).
 constexpr std::chrono::milliseconds kNapsAfterMessage{50};
-// How long the thread that calls flush() does the worker's work itself. The service answers a
-// request within microseconds unless it is busy. If it is busy, the cost of switching threads does
-// not matter.
+// How long a thread that calls flush() does the worker's work itself. The service answers a request
+// within microseconds unless it is busy. If it is busy, the cost of switching to the worker's
+// thread does not matter.
 constexpr std::chrono::milliseconds kLongestHelp{2};
-// Stands for "wait forever": larger durations could overflow the clock's time points.
+// Stands for "wait forever", because larger durations could overflow the clock's time points.
 constexpr std::chrono::hours kLongestWait{24 * 365};
 
 Options withDefaults(Options options) {
@@ -59,15 +60,16 @@ ClientWorker::ClientWorker(Options options)
       wakeUp_(eventfd(0, EFD_NONBLOCK | EFD_CLOEXEC)),
       watch_(places_),
       pause_(options_.reconnectMin) {
-  // The program's signals must go to its own threads, and a thread inherits the signal mask.
+  // Block signals while the thread starts, because it inherits the signal mask. The program's
+  // signals must go to the program's own threads.
   const platform::linux_::SignalsBlocked blocked;
   thread_.start([this] { run(); });
 }
 
 ClientWorker::~ClientWorker() {
   if (!isOwnProcess()) {
-    // After fork(), the thread exists only in the parent, and only the parent may use the
-    // connection. There is nothing to join here.
+    // This is a child process after fork(). The thread exists only in the parent, and only the
+    // parent may use the connection. Nothing can be joined here.
     thread_.abandon();
     return;
   }
@@ -87,7 +89,8 @@ ClientWorker::~ClientWorker() {
 
 template <typename Content>
 [[gnu::hot]] bool ClientWorker::push(const BasicMessageView<Content>& message) {
-  // Relaxed is enough: a program that sends while it destroys its client has a data race anyway.
+  // Relaxed is enough, because a program that sends while it destroys its client has a data race in
+  // any case.
   const bool isClosing = closing_.load(std::memory_order_relaxed);
   switch (isClosing ? EncodeOutcome::kNoRoom : ring_.tryPush(message)) {
     case EncodeOutcome::kNoRoom:
@@ -99,7 +102,7 @@ template <typename Content>
     case EncodeOutcome::kDone:
       break;
   }
-  // Wake the thread only if it sleeps. While it naps, it wakes up by itself.
+  // Wake the thread only if it sleeps. If it naps, it wakes up by itself.
   if (asleep_.load(std::memory_order_seq_cst) && asleep_.exchange(false)) wake();
   return true;
 }
@@ -122,7 +125,8 @@ void ClientWorker::post(SessionOperation operation) {
 }
 
 bool ClientWorker::flush(std::chrono::milliseconds timeout) {
-  // This thread runs the connection handler, and would have to do the work of the flush.
+  // The connection handler called flush() on the worker's thread. That thread would have to do the
+  // work of the flush while it waits.
   if (thread_.isCurrent()) return false;
   const TimePoint deadline =
       std::chrono::steady_clock::now() + std::min<std::chrono::milliseconds>(timeout, kLongestWait);
@@ -169,7 +173,7 @@ void ClientWorker::help(FlushTicket ticket, TimePoint deadline) {
     if (std::chrono::steady_clock::now() >= end) return;
     std::array<pollfd, 2> polled{{stream_.polled(POLLIN), {wakeUp_.get(), POLLIN, 0}}};
     pollUntil(polled, end);
-    // Another thread has woken the worker, which now waits for its turn.
+    // Another thread has woken the worker, which now waits for `turn_`.
     if (polled[1].revents != 0) return;
     if (polled[0].revents != 0 && !receive()) return;
   }
@@ -197,7 +201,7 @@ Counters ClientWorker::counters() const {
   counters.refused = refused_.load(std::memory_order_acquire) + withoutForm;
   counters.lost = lost_.load(std::memory_order_acquire);
   counters.reconnects = reconnects_.load(std::memory_order_relaxed);
-  // Read last. Otherwise the other counters together could exceed the accepted messages.
+  // Read this counter last. Otherwise the sum of the others could exceed the accepted messages.
   counters.accepted = ring_.tail() + withoutForm;
   counters.pending = counters.accepted - counters.acknowledged - counters.refused - counters.lost;
   return counters;
@@ -205,7 +209,7 @@ Counters ClientWorker::counters() const {
 
 void ClientWorker::wake() const {
   const std::uint64_t one = 1;
-  // Fails only if the thread has been woken already, or if there is no descriptor.
+  // The write fails only if the thread has been woken already, or if there is no descriptor.
   static_cast<void>(!write(wakeUp_.get(), &one, sizeof one));
 }
 
@@ -235,8 +239,8 @@ bool ClientWorker::mayFallAsleep() {
   nap_ = {};
   if (!isWindowOpen()) return true;  // the socket or the deadline ends the sleep, not a producer
   nap_ = napLength();
-  // Announce the sleep before the last look at the ring. A producer then sees the announcement, or
-  // this thread sees the producer's message.
+  // Announce the sleep before looking at the ring for the last time. Either a producer sees the
+  // announcement, or this thread sees the producer's message.
   if (nap_.count() == 0) asleep_.store(true, std::memory_order_seq_cst);
   const bool hasWork =
       ring_.isReady() || lanePosition_.load(std::memory_order_acquire) <= ring_.head();
@@ -266,8 +270,9 @@ void ClientWorker::sleepUntilSomethingHappens() {
   // poll() ignores negative descriptors.
   std::array<pollfd, 3> polled{{{wakeUp_.get(), POLLIN, 0}, {watch_.fd(), POLLIN, 0}, {-1, 0, 0}}};
   if (stream_.isOpen()) {
-    // Without an open call, only the end of the connection matters, and poll() always reports that.
-    // If a flush does the work meanwhile, the answer then wakes only the thread of the flush.
+    // While no call is open, wait only for the end of the connection, which poll() always reports.
+    // If a thread in flush() sends a call in that time, the answer then wakes only that thread and
+    // not this one.
     const bool expects = state_ == State::kConnecting || unanswered_ > 0;
     polled[2] = stream_.polled(expects ? POLLIN : 0);
   }
@@ -304,8 +309,8 @@ void ClientWorker::giveUpWaitingIfOverflowed() {
     lost_.fetch_add(1, std::memory_order_release);
   }
   ring_.release();
-  // The lost operations may have changed any session. Connecting again makes the sessions in their
-  // latest state.
+  // The discarded operations may have changed any session. Connect again: a new connection makes
+  // all sessions in their latest state.
   if (state_ != State::kAbsent) loseConnection();
 }
 

@@ -25,15 +25,15 @@
 
 namespace halvox::client {
 
-// The thread of a HalvoxClient, and the two lanes that lead to it.
+// The thread of a HalvoxClient, and the two ways by which work reaches it: the ring and the lane.
 //
 //   send() ──encodes──► FrameRing ──┐
 //                                   ├─► window of open calls ──► socket
 //   session operations ──► lane ────┘
 //
 // Messages go through the ring, as frames. Session operations and flushes are rare. They go through
-// a lane with a lock, and each notes how many messages the ring had accepted before it. The worker
-// can therefore carry out everything in the order of the calls.
+// the lane, which has a lock. Each entry of the lane has the number of messages that the ring had
+// accepted before it. The worker can therefore carry out everything in the order of the calls.
 //
 //   absent ──socket connects──► connecting ──handshake──► ready
 //     ▲                            │                        │
@@ -41,23 +41,23 @@ namespace halvox::client {
 //
 // The worker never blocks on the socket. It sends calls while fewer than kMaxOpenCalls are open,
 // and always reads answers, so that client and service cannot both wait for the other to read. If
-// the service does not answer, the worker takes nothing from the lanes, and they fill up to their
-// bounds.
+// the service does not answer, the worker takes nothing from the ring and the lane, and they fill
+// up to their bounds.
 //
-// For 50 milliseconds after a message, the worker looks into the ring again and again, after naps
-// of a few milliseconds. Messages gather during a nap and leave in one write, and send() makes no
-// system call. Then the worker sleeps, because an idle program must have no wake-ups, and the next
-// send() wakes it by one system call. With Options::isRealTime it does not sleep while a session
-// runs: it takes naps of at most 10 milliseconds.
+// For 50 milliseconds after a message, the worker naps for a few milliseconds at a time, and looks
+// into the ring after each nap. Messages gather during a nap and leave in one write, and send()
+// makes no system call. After that time the worker sleeps, because an idle program must have no
+// wake-ups. The next send() then wakes it with one system call. With Options::isRealTime the worker
+// does not sleep while a session runs, but takes naps of at most 10 milliseconds.
 //
 // If the worker is asleep, the thread that calls flush() does the worker's work, for at most two
-// milliseconds: two switches of threads cost more than the request. Only the thread that holds
-// `turn_` does that work. Only the worker's thread ends the connection and calls the connection
-// handler.
+// milliseconds. Waking the worker would cost two switches of threads, which is more than the
+// request. At any time only the thread that holds `turn_` does the worker's work. Only the worker's
+// thread ends the connection and calls the connection handler.
 //
-// If the lane overflows (kMaxWaitingOperations) while there is no service, the worker discards its
-// content and the waiting messages, which count as lost. After the next connection, it makes the
-// sessions in their latest state.
+// If the lane overflows (kMaxWaitingOperations) because there is no service, the worker discards
+// the operations in the lane and the waiting messages, which count as lost. After the next
+// connection, it makes the sessions in their latest state.
 class ClientWorker {
  public:
   explicit ClientWorker(Options options);
@@ -66,16 +66,16 @@ class ClientWorker {
   ClientWorker(const ClientWorker&) = delete;
   ClientWorker& operator=(const ClientWorker&) = delete;
 
-  // Any thread may call these; see HalvoxClient. The functions that send an encoded message are
-  // marked as hot: the linker then places them in one or two pages of code. An audio thread finds
-  // the caches cold at the start of each period, and its first message took about a tenth longer
-  // when the functions were in seven pages.
+  // Any thread may call these functions; see HalvoxClient. The functions that send an encoded
+  // message are marked as hot, which makes the linker place them in one or two pages of code. An
+  // audio thread finds the caches cold at the start of each period. When the functions were in
+  // seven pages, its first message took about a tenth longer.
   bool send(const MessageView& message);
   bool send(const EncodedMessageView& message);
   void post(SessionOperation operation);
   bool flush(std::chrono::milliseconds timeout);
   void setConnectionHandler(std::function<void(bool)> handler);
-  // Relaxed: the answer may already be outdated when the caller gets it.
+  // Relaxed, because the answer may be outdated in any case when the caller gets it.
   [[nodiscard]] bool isConnected() const { return connected_.load(std::memory_order_relaxed); }
   [[nodiscard]] std::string socketPath() const;
   [[nodiscard]] Counters counters() const;
@@ -85,13 +85,13 @@ class ClientWorker {
   using FlushTicket = std::uint64_t;
   using ConnectionHandler = std::function<void(bool)>;
   enum class State : std::uint8_t { kAbsent, kConnecting, kReady };
-  // A session operation or a flush, and the number of messages before it.
+  // A session operation or a flush, and the number of messages that were accepted before it.
   struct LaneEntry {
     std::uint64_t position = 0;
     std::variant<SessionOperation, FlushTicket> step;
   };
-  // A call that the service has not answered, or one after such a call. The call of a flush stays
-  // here until all calls before it are answered.
+  // A call that the service has not answered, or an answered call after such a call. The call of a
+  // flush therefore stays here until all calls before it are answered.
   struct OpenCall {
     enum class Kind : std::uint8_t { kOperation, kMessage, kFlush };
     Kind kind = Kind::kOperation;
@@ -112,7 +112,7 @@ class ClientWorker {
   [[nodiscard]] std::chrono::milliseconds napLength() const;
   void sleepUntilSomethingHappens() HALVOX_REQUIRES(turn_);
   [[nodiscard]] TimePoint nextDeadline() const;
-  // Runs on the thread that calls flush().
+  // Does the worker's work on the thread that calls flush().
   void help(FlushTicket ticket, TimePoint deadline);
   [[nodiscard]] bool isFlushDone(FlushTicket ticket);
 
@@ -151,19 +151,20 @@ class ClientWorker {
   FrameRing ring_;
   const pid_t process_;
   platform::linux_::UniqueFd wakeUp_;
-  std::atomic<bool> asleep_{false};  // sequentially consistent with the frames of the ring
+  std::atomic<bool> asleep_{false};  // sequentially consistent with the ring's newest_
   std::atomic<bool> closing_{false};
   std::atomic<bool> connected_{false};
   std::atomic<std::uint64_t> dropped_{0};
   std::atomic<std::uint64_t> withoutForm_{0};  // accepted and refused without entering the ring
-  // Written only by the worker. counters() reads them before the ring's tail(), so that their sum
-  // is never larger than the accepted messages.
+  // Written only by the thread that holds `turn_`. counters() reads them before the ring's tail().
+  // Their sum is therefore never larger than the number of accepted messages.
   std::atomic<std::uint64_t> acknowledged_{0};
   std::atomic<std::uint64_t> refused_{0};
   std::atomic<std::uint64_t> lost_{0};
   std::atomic<std::uint64_t> reconnects_{0};
-  // The position of the first entry of the lane. Written under the lock. A thread publishes a
-  // message after its earlier operations, and the worker therefore sees the operations first.
+  // The position of the first entry of the lane; UINT64_MAX if the lane is empty. Written under the
+  // lock. A thread publishes a message after its earlier operations, and a worker that sees the
+  // message therefore sees these operations, too.
   std::atomic<std::uint64_t> lanePosition_{UINT64_MAX};
 
   mutable platform::linux_::Mutex mutex_;
@@ -178,8 +179,8 @@ class ClientWorker {
   bool endNow_ HALVOX_GUARDED_BY(mutex_) = false;
   std::string shownPlace_ HALVOX_GUARDED_BY(mutex_);  // of the current or last connection
 
-  // Held by the thread that does the worker's work. The worker itself holds it, except while it
-  // sleeps. Taken before `mutex_`.
+  // Held by the thread that does the worker's work. The worker's own thread holds it except while
+  // it sleeps or naps. Lock it before `mutex_`.
   platform::linux_::Mutex turn_;
   // The following members belong to the thread that holds `turn_`.
   SocketWatch watch_;
@@ -191,9 +192,9 @@ class ClientWorker {
   std::chrono::milliseconds pause_;
   bool everConnected_ = false;
   SessionTable made_;                      // after all operations that were sent
-  std::deque<SessionOperation> remaking_;  // to be sent before anything from the lanes
+  std::deque<SessionOperation> remaking_;  // sent before anything from the ring and the lane
   std::deque<FlushTicket> interruptedFlushes_;
-  TimePoint lastMessage_{};           // when the worker last took one out of the ring
+  TimePoint lastMessage_{};           // when a message was last taken out of the ring
   std::chrono::milliseconds nap_{0};  // the next nap; 0: sleep until woken
   bool readable_ = false;             // the socket may have bytes to read, or have been closed
   bool windowIsOpen_ = true;

@@ -9,23 +9,25 @@ namespace {
 
 using platform::linux_::MutexLock;
 
-// Enough to keep the service busy; few enough that the outcome of a message is known soon.
+// How many calls may be open. This is enough to keep the service busy, and few enough that the
+// outcome of a message is known soon.
 constexpr std::size_t kMaxOpenCalls = 256;
 // The same limit in bytes. A single larger message is allowed.
 constexpr std::size_t kMaxOpenBytes = std::size_t{4} << 20U;
-// A full window opens again when half of it is answered: fewer and larger writes.
+// A full window opens again when half of its calls are answered. This makes writes fewer and
+// larger.
 constexpr std::size_t kReopenAtCalls = kMaxOpenCalls / 2;
 constexpr std::size_t kReopenAtBytes = kMaxOpenBytes / 2;
-// Calls are tracked from the oldest unanswered one to the newest. If there are more than this, the
-// service is considered broken, and the client closes the connection.
+// The client keeps track of the calls from the oldest unanswered one to the newest. If there are
+// more than this, it considers the service broken and closes the connection.
 constexpr std::size_t kMostTrackedCalls = std::size_t{1} << 16U;
-// How many messages are sent before their room is given back to the producers.
+// After this many sent messages, their cells in the ring are released for the producers.
 constexpr int kReleaseAfter = 64;
 
 }  // namespace
 
 void ClientWorker::tryConnect() {
-  // Watch first: a service that appears after the attempt is then noticed.
+  // Begin to watch before the attempt. A service that appears after the attempt is then noticed.
   watch_.begin();
   auto connected = connectToService(placesToTry());
   if (auto* made = std::get_if<ConnectedStream>(&connected)) {
@@ -110,7 +112,8 @@ void ClientWorker::pauseBeforeRetry() {
 
 void ClientWorker::retryNow() {
   if (state_ != State::kAbsent) return;
-  // A socket appears a moment before the service listens on it. Try again soon.
+  // A socket appears a moment before the service listens on it. Use the shortest pauses, because
+  // the first attempt may come too early.
   pause_ = options_.reconnectMin;
   retryAt_ = {};
 }
@@ -145,7 +148,7 @@ void ClientWorker::sendAll() {
   }
   ring_.release();
   if (ring_.head() != before) lastMessage_ = std::chrono::steady_clock::now();
-  // The worker notices a failure when it next looks at the connection.
+  // Ignore a failure here. The worker notices it when it next looks at the connection.
   if (stream_.isOpen()) stream_.send();
 }
 
@@ -162,8 +165,8 @@ bool ClientWorker::sendNext() {
     sendFlush(ticket);
     return true;
   }
-  // Look at the ring first: operations that a thread posted before this message are then visible in
-  // the lane.
+  // Look at the ring before the lane. If there is a message, the operations that its thread posted
+  // before it are then visible in the lane.
   const bool hasMessage = ring_.isReady();
   if (lanePosition_.load(std::memory_order_acquire) <= ring_.head()) {
     sendFromLane();
@@ -190,20 +193,21 @@ void ClientWorker::sendFromLane() {
     return;
   }
   const auto& operation = std::get<SessionOperation>(entry.step);
-  // Note the operation before sending it. If the connection ends here, the operation is then made
-  // again with the others.
+  // Apply the operation to made_ before sending it. If the connection ends now, the operation is
+  // then repeated on the next connection.
   made_.apply(operation);
   sendOperation(operation);
 }
 
 void ClientWorker::sendOperation(const SessionOperation& operation) {
   Request request = makeRequest(operation);
-  // Only a configuration that the wire cannot hold fails here. Trying again would not help.
+  // This fails only for a configuration that cannot be encoded for the wire. Drop it, because
+  // trying again would not help.
   auto* frame = std::get_if<std::string>(&request);
   if (frame == nullptr) return;
   if (std::holds_alternative<StartSession>(operation.step)) {
-    // The service answers a start only at the stop. The client does not wait for that and asks for
-    // no answer.
+    // The service answers a start only at the stop. The client does not wait for that, and asks the
+    // service not to answer.
     numberWithoutAnswer(frame->data());
   } else {
     numberCall(frame->data(), {});
@@ -228,8 +232,8 @@ void ClientWorker::sendMessageAtHead() {
 }
 
 void ClientWorker::numberCall(char* frame, const OpenCall& call) {
-  // No call may have the number 0. In its place, an entry that counts as answered keeps the numbers
-  // consecutive.
+  // No call may have the serial 0. Add an entry in its place that counts as answered, because the
+  // serials in open_ must be consecutive.
   if (++lastSerial_ == 0 && !open_.empty()) open_.push_back({.isAnswered = true});
   if (lastSerial_ == 0) ++lastSerial_;
   setSerial(frame, lastSerial_);

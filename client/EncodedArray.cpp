@@ -25,7 +25,8 @@ template void EncodedArray::appendVariant(const platform::Date& value);
 template void EncodedArray::appendVariant(const WireData& value);
 
 void EncodedArray::append(const EncodedArray& array) {
-  // Reserve first: that may move the elements, and `array` may be this one.
+  // Reserve before using the elements of `array`. It may be this array, and reserving may move its
+  // elements.
   reserve(variantRoom(array.wireForm()));
   appendVariant(array.wireForm());
 }

@@ -12,11 +12,11 @@ namespace halvox::client {
 class EncodedDictionary;
 
 // A list of values in their encoding on the wire. Belongs to the program. Several threads may read
-// one at the same time; while one thread changes it, no other may use it.
+// an array at the same time. While one thread changes it, no other thread may use it.
 //
-// Padding depends on where the array begins in its message: at a multiple of 8 or 4 bytes after
-// one. The array keeps its elements in both forms. A message copies the form that fits, without
-// decoding it.
+// The padding between elements depends on where the first element is in its message: at a multiple
+// of 8, or 4 bytes after one. The array keeps its elements in both forms. A message copies the form
+// that fits, without decoding it.
 class EncodedArray {
  public:
   EncodedArray();
@@ -25,8 +25,9 @@ class EncodedArray {
 
   [[nodiscard]] std::size_t size() const { return size_; }
 
-  // Append a copy of one value. If they throw std::bad_alloc, the array is unchanged. A text must
-  // be UTF-8 without NUL; for another one, append() returns false and changes nothing.
+  // These functions append a copy of one value. If they throw std::bad_alloc, the array is
+  // unchanged. If a text is not UTF-8 or contains a NUL, append() returns false and changes
+  // nothing.
   template <platform::ArithmeticNumber Number>
   void append(Number number) {
     appendVariant(wireNumber(number));
@@ -38,7 +39,7 @@ class EncodedArray {
   [[nodiscard]] bool append(std::string_view text);
   [[nodiscard]] bool append(const char* text) { return append(std::string_view(text)); }
 
-  // The elements; valid until this array is changed.
+  // Returns the elements; valid until this array is changed.
   [[nodiscard]] WireArray wireForm() const {
     return {atEight_.bytes(), atFour_.bytes().subspan(kFour), levels_};
   }

@@ -12,8 +12,8 @@ namespace {
 
 namespace dbus = platform::linux_::dbus;
 
-// What an entry needs in addition to its key and its variant: padding on both sides, the length of
-// the key and its NUL.
+// How many bytes an entry needs in addition to its key and its variant: for padding before and
+// after it, the length of the key and the key's NUL.
 constexpr std::size_t kKeyRoom = 24;
 
 constexpr std::size_t roundUp(std::size_t size) { return (size + 7) & ~std::size_t{7}; }
@@ -24,9 +24,8 @@ struct KeyScan {
   bool isPlain = false;  // ASCII without NUL; anything else needs the full test
 };
 
-// Reads texts of up to 32 bytes as two or four words that may overlap. A loop would have an end
-// that the processor cannot predict. The program chooses its keys; the hash therefore needs no
-// secret.
+// Reads a key of 8 to 32 bytes as two or four words that may overlap. The processor could not
+// predict the end of a loop. The hash needs no secret, because the program itself chooses its keys.
 inline KeyScan scan(std::string_view key) {
   constexpr std::uint64_t kFactors[] = {0x9E3779B97F4A7C15, 0xC2B2AE3D27D4EB4F, 0x165667B19E3779F9,
                                         0xD6E8FEB86659FD93};
@@ -65,8 +64,8 @@ char* aligned(char* at, std::size_t alignment) {
   return at + ((0 - reinterpret_cast<std::uintptr_t>(at)) & (alignment - 1));
 }
 
-// Each overwrites the variant with a value that takes the same bytes. Returns false if the variant
-// is of another type or size.
+// Each of these functions overwrites a variant with a value of the same type and size. Returns
+// false if the variant has another type or size.
 bool overwrite(char* variant, const WireNumber& number) {
   if (variant[0] != 1 || variant[1] != number.type) return false;
   char* const at = aligned(variant + 3, number.size);
@@ -118,7 +117,7 @@ bool EncodedDictionary::hasKey(const Entry& entry, std::string_view key) const {
   return std::string_view(at + sizeof length, length) == key;
 }
 
-// Returns size() if there is no such key.
+// Returns the index of the key's entry, or size() if there is no such key.
 inline std::size_t EncodedDictionary::find(std::string_view key, std::uint32_t hash) const {
   return (seen_ & seenBit(hash)) == 0 ? size() : findSeen(key, hash);
 }
@@ -143,7 +142,7 @@ char* EncodedDictionary::variantOf(std::size_t index, std::string_view key) {
   return startOf(index) + sizeof(std::uint32_t) + key.size() + 1;
 }
 
-// Makes room for one more entry. Everything that can fail happens here.
+// Makes space for one more entry. All steps that can fail are here.
 inline void EncodedDictionary::reserve(std::size_t room) {
   bytes_.reserve(room);
   if (entries_.size() >= kInlineEntries) reserveEntry();
@@ -202,7 +201,8 @@ void EncodedDictionary::append(std::string_view key, std::uint32_t hash, const W
                    .padding = static_cast<std::uint8_t>(roundUp(bytes_.size()) - bytes_.size())});
 }
 
-// Replaces an entry by the last one, before which there were `sizeBefore` bytes.
+// Moves the last entry to the place of another entry, which it replaces. `sizeBefore` is the number
+// of bytes before the last entry was appended.
 void EncodedDictionary::moveLastTo(std::size_t index, std::size_t sizeBefore) {
   const std::size_t last = entries_.size() - 1;
   Entry made = entries_[last];
@@ -221,7 +221,7 @@ void EncodedDictionary::moveLastTo(std::size_t index, std::size_t sizeBefore) {
   const std::size_t padded = madeBytes + made.padding;
   std::memset(from + madeBytes, 0, made.padding);
   std::rotate(to, from, from + padded);
-  // Now the order is: the new entry, the old one, those after it.
+  // The order is now: the new entry, the old entry, the entries after the old one.
   const auto oldBytes = static_cast<std::size_t>(next - to);
   const std::size_t rest = sizeBefore - static_cast<std::size_t>(next - bytes_.data());
   std::memmove(to + padded, to + padded + oldBytes, rest);
@@ -280,7 +280,8 @@ bool EncodedDictionary::set(std::string_view key, std::span<const std::byte> byt
 }
 
 bool EncodedDictionary::set(std::string_view key, const EncodedDictionary& dictionary) {
-  // Reserve first: that may move the entries, and `dictionary` may be this one.
+  // Reserve before using the entries of `dictionary`. It may be this dictionary, and reserving may
+  // move its entries.
   reserve(kKeyRoom + key.size() + variantRoom(dictionary.wireForm()));
   return setVariant(key, dictionary.wireForm());
 }

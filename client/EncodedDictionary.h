@@ -14,16 +14,16 @@ namespace halvox::client {
 
 class EncodedArray;
 
-// A dictionary in its encoding on the wire. For messages that are sent again and again: sending
-// copies the bytes, and a new number for a key overwrites the old one in place.
-// Belongs to the program. Several threads may read one at the same time, and sending it counts as
-// reading; while one thread changes it, no other may use it.
+// A dictionary in its encoding on the wire. It is made for messages that are sent again and again:
+// sending copies the bytes, and a new number for a key overwrites the old one in place.
+// Belongs to the program. Several threads may read a dictionary at the same time, and sending it
+// counts as reading. While one thread changes it, no other thread may use it.
 //
 //   bytes    │ key, variant │pad│ key, variant │pad│ key, variant │
 //             ▲ 0                ▲ entries_[1]      ▲ entries_[2]   ▲ no padding after the last one
 //
-// Each entry begins at a multiple of 8. Entries can therefore move by such multiples without a
-// change inside. Up to 512 bytes and 16 entries need no memory but the object itself.
+// Each entry begins at a multiple of 8. An entry can therefore move by a multiple of 8 without a
+// change of its padding. Up to 512 bytes and 16 entries need no memory except the object itself.
 //
 // set() copies the key and the value. If it throws std::bad_alloc, the dictionary is unchanged. An
 // existing key keeps its position. A number or a date that replaces one of the same type allocates
@@ -36,7 +36,8 @@ class EncodedDictionary {
 
   [[nodiscard]] std::size_t size() const { return entries_.size(); }
 
-  // Return false, and change nothing, if the key or the text is not UTF-8 without NUL.
+  // These functions return false and change nothing if the key or the text is not UTF-8 or contains
+  // a NUL.
   template <platform::ArithmeticNumber Number>
   bool set(std::string_view key, Number number) {
     return setNumber(key, wireNumber(number));
@@ -51,9 +52,9 @@ class EncodedDictionary {
   // Returns false if there was no such key.
   bool remove(std::string_view key);
 
-  // The entries; valid until this dictionary is changed.
+  // Returns the entries; valid until this dictionary is changed.
   [[nodiscard]] WireDictionary wireForm() const { return {bytes_.bytes(), levels_}; }
-  // The same dictionary as a value; std::nullopt if it is nested deeper, or is longer, than a
+  // Returns the same dictionary as a value; std::nullopt if it is longer or nested deeper than a
   // message can be.
   [[nodiscard]] std::optional<platform::Dictionary> decode() const;
 
@@ -62,14 +63,16 @@ class EncodedDictionary {
   // Up to this number of entries, comparing all hashes is faster than a table.
   static constexpr std::size_t kMostWithoutTable = 64;
 
-  // Not initialized: a program makes thousands of dictionaries a second, and most have few entries.
+  // The members are not initialized, because a program makes thousands of dictionaries a second and
+  // most of them have few entries.
   struct Entry {
     std::uint32_t start;   // in units of 8 bytes
     std::uint32_t hash;    // of the key
     std::uint8_t levels;   // of the value
     std::uint8_t padding;  // the bytes after the entry, up to a multiple of 8
   };
-  // A few entries are in the object itself. When there are more, all of them are on the heap.
+  // The list of entries. A few entries are in the object itself. If there are more, all of them are
+  // on the heap.
   class Entries {
    public:
     [[nodiscard]] std::size_t size() const { return size_; }
@@ -110,11 +113,11 @@ class EncodedDictionary {
   ByteBuffer<512> bytes_;
   Entries entries_;
   unsigned levels_ = 0;  // of the deepest value
-  // A bit for the hash of each key that was ever set. Most new keys find theirs unset and need no
-  // comparison.
+  // Each key that was ever set has set the bit that its hash chooses. For most new keys this bit is
+  // not set, and they need no comparison.
   std::uint64_t seen_ = 0;
-  // Only for a large dictionary: the number of an entry plus 1, at a place that its hash chooses; 0
-  // if the place is free. Its size is a power of two.
+  // Used only by a large dictionary. Has the index of each entry plus 1, at a place that the
+  // entry's hash chooses; 0 if the place is free. The size is a power of two.
   std::vector<std::uint32_t> table_;
 };
 

@@ -20,7 +20,7 @@ using platform::Date;
 
 const std::vector<ReporterID> kIds{7, -8};
 
-// The frame of a message that is kept in its encoded form.
+// Returns the frame of a message that is kept in its encoded form.
 std::string frameOf(const EncodedDictionary& message) {
   HeapSegments segments;
   SegmentWriter writer(segments);
@@ -30,7 +30,7 @@ std::string frameOf(const EncodedDictionary& message) {
   putMessageHeader(frame.data(), writer.position());
   return frame + segments.join(writer.position());
 }
-// The frame of an ordinary dictionary, which is encoded when it is sent.
+// Returns the frame of an ordinary dictionary, which is encoded when it is sent.
 std::string frameOf(const Dictionary& message) {
   const Request request = makeRequest(MessageView{kIds, message, 0x08000004, 17});
   const auto* frame = std::get_if<std::string>(&request);
@@ -40,7 +40,7 @@ std::span<const std::byte> bytesOf(std::string_view text) {
   return std::as_bytes(std::span(text.data(), text.size()));
 }
 
-// A message of ten fields and the same message as an ordinary dictionary.
+// Fixture: a message of ten fields, and the same message as an ordinary dictionary.
 void fill(EncodedDictionary& message) {
   message.set("frame_counter", std::int64_t{1});
   message.set("flags", std::uint8_t{3});
@@ -104,7 +104,7 @@ TEST(EncodedDictionaryTest, AValueOfTheSameTypeReplacesTheOldOneInPlace) {
   EXPECT_EQ(frameOf(message), frameOf(expected));
 }
 
-// Each place, with a value that is shorter or longer than the old one.
+// Replaces the value at each place by shorter and by longer values.
 TEST(EncodedDictionaryTest, AValueOfAnotherSizeMovesTheOthers) {
   for (const auto& [key, old] : filled()) {
     for (std::size_t size = 0; size < 40; ++size) {
@@ -214,7 +214,8 @@ TEST(EncodedDictionaryTest, RefusesTextThatIsNotUtf8AndChangesNothing) {
   EXPECT_EQ(frameOf(message), frameOf(filled()));
 }
 
-// Puts a bad byte at every place of texts whose lengths are around the multiples of a word.
+// Puts an invalid byte at every place of texts whose lengths are near the multiples of a word's
+// size.
 TEST(EncodedDictionaryTest, FindsNulsAndBytesThatAreNotUtf8AtAnyPlace) {
   for (std::size_t size = 1; size <= 50; ++size) {
     const std::string good(size, 'x');
@@ -233,7 +234,7 @@ TEST(EncodedDictionaryTest, FindsNulsAndBytesThatAreNotUtf8AtAnyPlace) {
   }
 }
 
-// Keys that differ in one byte, at each place.
+// The keys differ only in the place of one byte.
 TEST(EncodedDictionaryTest, KeysThatDifferInOneByteAreDifferent) {
   for (std::size_t size = 1; size <= 50; ++size) {
     EncodedDictionary message;
@@ -302,7 +303,7 @@ TEST(EncodedDictionaryTest, DecodesToTheSameDictionary) {
   EXPECT_EQ(EncodedDictionary().decode(), Dictionary());
 }
 
-// More keys than are compared one by one.
+// There are more keys than a dictionary compares one by one.
 TEST(EncodedDictionaryTest, AnyNumberOfKeysIsFoundAgain) {
   constexpr int kKeys = 1000;
   EncodedDictionary message;
@@ -324,7 +325,8 @@ TEST(EncodedDictionaryTest, AnyNumberOfKeysIsFoundAgain) {
   EXPECT_EQ(frameOf(message), frameOf(expected));
 }
 
-// A message that was changed many times must be the message that was made at once.
+// A message that was changed many times must be equal to a message that was made with the final
+// values.
 TEST(EncodedDictionaryTest, ChangesInAnyOrderGiveTheFrameOfTheResult) {
   std::mt19937 random(1);
   const auto below = [&](unsigned end) { return static_cast<unsigned>(random() % end); };

@@ -10,14 +10,16 @@
 namespace halvox::client {
 namespace {
 
-// Even an unlimited ring does not need more address space than this.
+// The largest bounds of a ring. No ring needs more address space than kMostBytes.
 constexpr std::size_t kMostBytes = std::size_t{1} << 30U;
 constexpr std::size_t kMostFrames = std::size_t{1} << 24U;
-// Memory that is touched in advance: as much as a burst needs while the client's thread keeps up. A
-// page fault would cost an audio thread more than the whole message. A multiple of any page.
+// How much memory is touched in advance: as much as a burst needs while the client's thread keeps
+// up. A page fault would cost an audio thread more than the whole message. The size is a multiple
+// of every page size.
 constexpr std::size_t kTouchedBytes = std::size_t{256} * 1024;
 
-// The high half of a word is a counter. The low half is the number of a cell plus 1, or 0 for none.
+// free_ and newest_ are words of two halves. The high half is a counter. The low half is the number
+// of a cell plus 1, or 0 for no cell.
 constexpr std::uint64_t kOneMore = std::uint64_t{1} << 32U;
 constexpr std::uint64_t kCountMask = ~std::uint64_t{UINT32_MAX};
 std::uint32_t countOf(std::uint64_t word) { return static_cast<std::uint32_t>(word >> 32U); }
@@ -49,7 +51,7 @@ class FrameRing::ChainSource final : public SegmentSource {
     return {isFirst ? begin + sizeof(FrameHead) : begin, end};
   }
   [[nodiscard]] CellNumber first() const { return chain_.first; }
-  // Leaves the cells to the ring.
+  // The frame is in the ring now. Does not return its cells.
   void release() { chain_ = {}; }
 
  private:
@@ -83,7 +85,7 @@ EncodeOutcome FrameRing::tryPush(const MessageView& message) { return push(messa
 
 template <typename Content>
 [[gnu::hot]] EncodeOutcome FrameRing::push(const BasicMessageView<Content>& message) {
-  // publish() tests this again. The test here avoids encoding a message while the ring is full.
+  // publish() tests this again. The test here saves encoding a message while the ring is full.
   if (isFull(newest_.load(std::memory_order_relaxed))) return EncodeOutcome::kNoRoom;
   ChainSource cells(*this);
   SegmentWriter writer(cells);
@@ -105,8 +107,8 @@ void FrameRing::setHead(CellNumber number, const FrameHead& head) const {
 }
 
 bool FrameRing::isFull(std::uint64_t newest) const {
-  // `newest` may be outdated, with a count below that of the released frames. The difference is
-  // then negative.
+  // `newest` may be outdated, and its count may be less than the number of released frames. The
+  // difference is then negative, and must be compared as a signed number.
   const auto released = static_cast<std::uint32_t>(released_.load(std::memory_order_relaxed));
   return static_cast<std::int32_t>(countOf(newest) - released) >=
          static_cast<std::int32_t>(maxFrames_);
@@ -126,7 +128,8 @@ bool FrameRing::isFull(std::uint64_t newest) const {
 }
 
 std::uint64_t FrameRing::tail() const {
-  // Fewer frames than half of the range of the count are in the ring.
+  // The count has 32 bits. The ring never has as many frames as half of its range, and the
+  // difference of the counts is therefore exact.
   const std::uint64_t released = released_.load(std::memory_order_acquire);
   const std::uint32_t count = countOf(newest_.load(std::memory_order_seq_cst));
   return released + static_cast<std::uint32_t>(count - static_cast<std::uint32_t>(released));
@@ -136,8 +139,8 @@ std::uint64_t FrameRing::tail() const {
   std::uint64_t top = free_.load(std::memory_order_acquire);
   while (static_cast<std::uint32_t>(top) != 0) {
     const CellNumber first = static_cast<std::uint32_t>(top) - 1;
-    // If another thread takes this cell meanwhile, the number read here is wrong, and the exchange
-    // fails.
+    // If another thread takes this cell before the exchange, the number read here may be wrong. The
+    // exchange then fails.
     const CellNumber second = next(first).load(std::memory_order_relaxed);
     const std::uint64_t rest = (top & kCountMask) + kOneMore + (second + 1U);
     if (free_.compare_exchange_weak(top, rest, std::memory_order_acquire)) return first;
@@ -160,9 +163,11 @@ void FrameRing::pushCells(const Chain& chain) {
                                         std::memory_order_relaxed));
 }
 
-// Takes over what the producers have published since the last call.
+// Takes all frames that the producers have published since the last call, and brings them into the
+// order of publishing. Returns false if there is none.
 bool FrameRing::takeList() {
-  // The load alone keeps the line of the word with the producers while there is nothing.
+  // Load first. While there is no frame, a load leaves the cache line of the word with the
+  // producers, whereas fetch_and() would take it from them.
   if (static_cast<std::uint32_t>(newest_.load(std::memory_order_seq_cst)) == 0) return false;
   const std::uint64_t newest = newest_.fetch_and(kCountMask, std::memory_order_acq_rel);
   CellNumber number = static_cast<std::uint32_t>(newest) - 1U;
@@ -209,8 +214,8 @@ void FrameRing::release() {
   touchAhead();
 }
 
-// Has the kernel map what the producers need next. Kernels before 5.14 refuse. The producers then
-// take the page faults.
+// Lets the kernel map the memory that the producers need next. Kernels before 5.14 refuse this, and
+// the producers then cause the page faults.
 void FrameRing::touchAhead() {
   const std::size_t all = std::size_t{cells_} * kCellBytes;
   const std::size_t used = std::size_t{fresh_.load(std::memory_order_relaxed)} * kCellBytes;

@@ -24,7 +24,7 @@ bool pushNumber(FrameRing& ring, std::int64_t number, ReporterID id = 7) {
   return push(ring, {{"number", number}}, id) == EncodeOutcome::kDone;
 }
 
-// The arguments of the oldest frame, as the service decodes them.
+// Returns the arguments of the oldest frame, as the service decodes them.
 std::vector<Value> takeArguments(FrameRing& ring) {
   if (!ring.isReady()) return {};
   std::string frame(kMessageHeaderBytes + ring.frontBytes(), '\0');
@@ -61,7 +61,7 @@ TEST(FrameRingTest, HoldsNoMoreFramesThanItsBoundEvenWhenThatIsNoPowerOfTwo) {
   for (int number = 0; number < 5; ++number) EXPECT_TRUE(pushNumber(ring, number));
   EXPECT_FALSE(pushNumber(ring, 5));
   takeNumber(ring);
-  EXPECT_FALSE(pushNumber(ring, 5));  // the room comes back with release()
+  EXPECT_FALSE(pushNumber(ring, 5));  // the cells are free only after release()
   ring.release();
 
   EXPECT_TRUE(pushNumber(ring, 5));
@@ -140,7 +140,8 @@ TEST(FrameRingTest, FramesTakenNowhereAreGone) {
   EXPECT_EQ(takeNumber(ring), 2);
 }
 
-// The consumer takes all frames as one list. Frames that come meanwhile follow that list.
+// The consumer takes all frames as one list. Frames that are published after that come after this
+// list.
 TEST(FrameRingTest, FramesThatComeWhileOthersAreTakenComeOutAfterThem) {
   FrameRing ring(100, kPlentyOfBytes);
   for (int number = 0; number < 3; ++number) ASSERT_TRUE(pushNumber(ring, number));
@@ -155,8 +156,8 @@ TEST(FrameRingTest, FramesThatComeWhileOthersAreTakenComeOutAfterThem) {
   EXPECT_EQ(ring.tail(), 6U);
 }
 
-// Each producer numbers its messages, some of which take several cells. The consumer must see each
-// producer's numbers rise without a gap, and every frame whole.
+// Each producer numbers its messages, and some messages take several cells. The consumer must see
+// the numbers of each producer rise without a gap, and every frame must be complete.
 TEST(FrameRingTest, KeepsEachProducersOrderAndLosesNothingThatItTook) {
   constexpr int kProducers = 4;
   constexpr std::int64_t kTaken = 10'000;

@@ -21,8 +21,8 @@ using platform::Value;
 
 // The number of a session, chosen by the program that creates it. 0 means no session.
 using ReporterID = std::int64_t;
-// client/Vocabulary.h names their values: what a message is about, what happened, and what kind of
-// audio a session is for.
+// What a message is about, what happened, and what kind of audio a session is for.
+// client/Vocabulary.h has names for the values.
 using Category = std::uint32_t;
 using EventType = std::uint16_t;
 using ServiceType = std::uint16_t;
@@ -49,17 +49,17 @@ struct Result {
 };
 
 struct Options {
-  // The socket of the service. If it is empty and $HALVOX_SOCKET is set, the client tries only that
-  // one. Otherwise it tries the user's service, $XDG_RUNTIME_DIR/halvox/reporting.sock, then the
-  // system's service, /run/halvox/reporting.sock. It takes the first place at which a service
-  // listens.
+  // The socket of the service. If this path is empty, the client tries the usual places: only
+  // $HALVOX_SOCKET if that is set; otherwise the user's service,
+  // $XDG_RUNTIME_DIR/halvox/reporting.sock, then the system's service, /run/halvox/reporting.sock.
+  // It uses the first place at which a service listens.
   std::string socketPath;
-  // Bounds of the messages that wait for the client's thread, in number and in bytes of memory. A
-  // message takes the size of its body on the wire plus 8 bytes, rounded up to a multiple of 512.
-  // When either bound is reached, send() drops the message and counts it. The bounds themselves are
-  // at most 16,777,216 messages and 1 GiB. By default, 8,192 messages of ten fields fit, and a
-  // message may have nearly 4 MiB. In a program that has called mlockall(MCL_FUTURE), all of these
-  // bytes are in memory.
+  // The bounds of the messages that wait for the client's thread: their number and their bytes of
+  // memory. A message takes the size of its body on the wire plus 8 bytes, rounded up to a multiple
+  // of 512. When either bound is reached, send() drops the message and counts it. Larger values
+  // than 16,777,216 messages and 1 GiB count as these. With the defaults, 8,192 messages of ten
+  // fields can wait, and a message may have nearly 4 MiB. In a program that has called
+  // mlockall(MCL_FUTURE), all of these bytes are resident.
   std::size_t maxPendingMessages = 8192;
   std::size_t maxPendingBytes = 4U << 20U;
   // The longest time that making a connection may take.
@@ -68,11 +68,11 @@ struct Options {
   std::chrono::milliseconds reconnectMin{50};
   std::chrono::milliseconds reconnectMax{2000};
   // After a connection has ended, the client tries only the same place for this long. A service
-  // that is being restarted must not lose its clients to another one.
+  // that is being restarted must not lose its clients to a service at another place.
   std::chrono::milliseconds samePlaceFor{10'000};
-  // For programs that send from audio threads. While a session runs, the client's thread then looks
-  // for messages by itself, and send() never makes a system call to wake it. The thread looks up to
-  // a thousand times a second, and a hundred times a second if no messages come.
+  // For programs that send from audio threads. If true, the client's thread looks for messages by
+  // itself while a session runs, and send() never makes a system call to wake it. The thread looks
+  // up to a thousand times a second, and a hundred times a second if no messages come.
   bool isRealTime = false;
 };
 
@@ -82,29 +82,29 @@ struct Counters {
   std::uint64_t dropped = 0;       // send() returned false: a bound is reached, or the client ends
   std::uint64_t acknowledged = 0;  // answered by the service without an error
   std::uint64_t refused = 0;       // answered with an error, or not representable on the wire
-  // In flight when a connection ended. The client does not send them again, because the service may
-  // have received them. Also counts the messages that were discarded because 8,192 session
-  // operations had piled up without a service.
+  // Sent but not answered when a connection ended. The client does not send these messages again,
+  // because the service may have received them. Also counts the messages that were discarded
+  // because 8,192 session operations were waiting without a service.
   std::uint64_t lost = 0;
   std::uint64_t pending = 0;     // waiting or in flight
   std::uint64_t reconnects = 0;  // connections made after the first one
 };
 
-// A program's connection to the reporting service, for programs that must not wait for it.
+// A program's connection to the reporting service, for programs that must not wait for the service.
 //
-// One thread of its own exchanges all messages with the service. The operations below hand work to
-// that thread, in order, and requests are pipelined. If the service ends, the client waits for a
-// new one and connects to it. It then creates its sessions again with their types and
-// configurations, and starts those that were running. Messages from the meantime wait, up to the
-// bounds.
+// The client has one thread, which exchanges all messages with the service. The operations below
+// pass work to that thread, in order. The thread sends further requests before earlier ones are
+// answered. If the service ends, the client waits for a new service and connects to it. It then
+// creates its sessions again with their types and configurations, and starts those that were
+// running. Until then messages wait, up to the bounds.
 //
 // Any thread may call these functions. send() encodes the message on the caller's thread, and keeps
-// no reference to it. An audio thread may call it: it never blocks, takes no lock, allocates
-// nothing and does not wait for the service. It makes one system call, to wake the client's thread,
-// if no message was sent for 50 ms; with Options::isRealTime it makes none while a session runs.
-// The other operations may wait for a lock for a moment. After fork(), a client works only in the
-// process that made it. In a child flush() returns false at once, and destruction leaves the
-// connection to the parent.
+// no reference to it. An audio thread may call send(), because it never blocks, takes no lock,
+// allocates nothing and does not wait for the service. If no message was sent for 50 ms, send()
+// makes one system call, to wake the client's thread. With Options::isRealTime it makes none while
+// a session runs. The other operations may wait for a lock for a moment. After fork(), a client
+// works only in the process that made it. In a child process flush() returns false at once, and
+// destruction leaves the connection to the parent.
 //
 // The caller owns the client. Construction does not wait for the service and succeeds without one.
 // It throws std::system_error if the thread cannot be started, and std::bad_alloc if there is not
@@ -117,9 +117,9 @@ class HalvoxClient {
   HalvoxClient(const HalvoxClient&) = delete;
   HalvoxClient& operator=(const HalvoxClient&) = delete;
 
-  // The steps of a session's life, in their order. They return at once. A step for a session that
-  // the service does not know has no effect, and the service reports no error. setConfiguration()
-  // merges the dictionary into the session's configuration.
+  // The steps of a session's life, in their order. These functions return at once. A step for a
+  // session that the service does not know has no effect, and the service reports no error.
+  // setConfiguration() merges the dictionary into the session's configuration.
   void createSession(ReporterID id);
   void setServiceType(ReporterID id, ServiceType type);
   void setConfiguration(ReporterID id, Dictionary configuration);
@@ -127,37 +127,38 @@ class HalvoxClient {
   void stop(ReporterID id);
   void destroySession(ReporterID id);
 
-  // Hands over one message for a session. The session may belong to another client. Returns false
-  // if the message was dropped; see counters().
+  // Passes one message for a session to the client's thread. The session may belong to another
+  // client. Returns false if the message was dropped; see counters().
   bool send(ReporterID id, const Dictionary& message, Category category, EventType type);
-  // Hands over one message for several sessions. Without a list, the message is for all started
-  // sessions of all programs.
+  // Does the same for several sessions. Without a list, the message is for all started sessions of
+  // all programs.
   bool send(const std::optional<std::vector<ReporterID>>& ids, const Dictionary& message,
             Category category, EventType type);
   bool sendTo(std::span<const ReporterID> ids, const Dictionary& message, Category category,
               EventType type);
-  // The same for a message in its encoded form (client/EncodedDictionary.h). Copies the bytes and
-  // encodes nothing.
+  // These functions do the same for a message in its encoded form (client/EncodedDictionary.h).
+  // They copy its bytes and encode nothing.
   bool send(ReporterID id, const EncodedDictionary& message, Category category, EventType type);
   bool sendTo(std::span<const ReporterID> ids, const EncodedDictionary& message, Category category,
               EventType type);
   bool sendToAll(const EncodedDictionary& message, Category category, EventType type);
 
-  // Blocks until everything that was handed over before this call has been answered or lost. If the
-  // client's thread is asleep, the calling thread does the sending and receiving for up to two
-  // milliseconds. Returns false after the time-out and when the client is being destroyed. On the
+  // Blocks until all operations and messages before this call have been answered or lost. If the
+  // client's thread is asleep, the calling thread itself sends and receives for up to two
+  // milliseconds. Returns false after the time-out, or if the client is being destroyed. On the
   // client's own thread, returns false at once.
   bool flush(std::chrono::milliseconds timeout);
-  // True while a connection to the service exists. Never blocks.
+  // Returns true while a connection to the service exists. Never blocks.
   [[nodiscard]] bool isConnected() const;
-  // The socket of the current or last connection; empty before the first one.
+  // Returns the socket of the current or last connection; empty before the first one.
   [[nodiscard]] std::string socketPath() const;
   [[nodiscard]] Counters counters() const;
-  // Sets the function to call when the connection is made (true) or lost (false). If there is a
-  // connection already, the function is called soon with true. An empty function removes the
-  // handler. The handler runs on the client's thread, which sends nothing meanwhile; it must not
-  // block or destroy the client. A call that is running while the handler is replaced may end after
-  // this function has returned. No call comes after the client's destruction.
+  // Sets the function that the client calls when the connection is made (true) or lost (false). If
+  // there is a connection already, the client calls it soon with true. An empty function removes
+  // the handler. The handler runs on the client's thread, which sends nothing until the handler
+  // returns. The handler must not block or destroy the client. If the handler is replaced while it
+  // runs, that call may end after this function has returned. The client does not call it after its
+  // destruction.
   void setConnectionHandler(std::function<void(bool connected)> handler);
 
  private:
@@ -165,26 +166,27 @@ class HalvoxClient {
   std::unique_ptr<Impl> impl_;
 };
 
-// A connection for tools: each operation sends one request, waits for the answer, at most for the
-// time-out given to open(), and returns it. Belongs to one thread. Does not reconnect: after the
-// connection has ended, every request fails with kNoService. Destruction closes the connection, and
-// the service then ends its sessions.
+// A connection for tools. Each operation sends one request, waits for the answer, at most for the
+// time-out given to open(), and returns the answer. Belongs to one thread. Does not reconnect:
+// after the connection has ended, every request fails with kNoService. Destruction closes the
+// connection, and the service then ends the sessions of this connection.
 //
-// For a session that it does not know, the service answers with true or default values, not with an
-// error.
+// If the service does not know the session of a request, it answers with true or default values,
+// not with an error.
 class HalvoxConnection {
  public:
-  // Connects to a socket; an empty path stands for the usual places as in Options. The failure
-  // names every place that was tried. Blocks for at most `timeout`.
+  // Connects to a socket. An empty path stands for the usual places; see Options::socketPath. The
+  // failure names every place that was tried. Blocks for at most `timeout`.
   static Result<std::unique_ptr<HalvoxConnection>> open(
       const std::string& socketPath, std::chrono::milliseconds timeout = std::chrono::seconds(5));
   ~HalvoxConnection();
   HalvoxConnection(const HalvoxConnection&) = delete;
   HalvoxConnection& operator=(const HalvoxConnection&) = delete;
 
-  // The socket of this connection.
+  // Returns the socket of this connection.
   [[nodiscard]] const std::string& socketPath() const;
-  // The sockets that were tried before this one. They exist, but no service listens on them.
+  // Returns the sockets that open() tried before and on which no service listens although they
+  // exist.
   [[nodiscard]] std::vector<std::string> unservedSockets() const;
 
   Result<bool> createReportingSession(ReporterID id);
@@ -192,20 +194,20 @@ class HalvoxConnection {
   // Despite its name, returns the service type of a session; 65535 for an unknown session.
   Result<ServiceType> getServiceNameForReporterID(ReporterID id);
   Result<bool> setConfiguration(const Dictionary& configuration, ReporterID id);
-  // Returns when the service has carried out the start. The answer to the start itself arrives only
-  // at the stop. This function therefore sends a query after the start and waits for the query's
-  // answer.
+  // Returns when the service has carried out the start. The service answers the start itself only
+  // at the stop. This function therefore sends a query after the start and waits for the answer to
+  // the query.
   Result<bool> startReportingSessionForID(ReporterID id);
   // Blocks until the last start of that session is answered, at most for `timeout`.
   Result<bool> waitForStartReply(ReporterID id, std::chrono::milliseconds timeout);
-  // Without a list of IDs the message is for all started sessions.
+  // Without a list of IDs, the message is for all started sessions of all programs.
   Result<bool> sendMessage(const Dictionary& message, Category category, EventType type,
                            const std::optional<std::vector<ReporterID>>& ids);
   Result<bool> stopReportingSessionForID(ReporterID id);
   Result<bool> destroyReportingSession(ReporterID id);
   // Returns "reporterID" and "serviceType" of a session; 0 and 65535 for an unknown one.
   Result<Dictionary> reporterIDValid(ReporterID id);
-  // The IDs of the sessions of all clients.
+  // Returns the IDs of the sessions of all clients.
   Result<std::vector<ReporterID>> getAllReporters();
   // Ends the service. The service does not answer; true means that the connection ended. Only root
   // and the user that the service runs as may do this; others are refused.

@@ -12,7 +12,7 @@
 
 namespace halvox::client {
 
-// Long enough for a slow machine.
+// The time limit of the tests. It is long enough for a slow machine.
 inline constexpr std::chrono::seconds kPatience{20};
 inline constexpr Category kPlayback = 4;
 inline constexpr EventType kStart = 1;

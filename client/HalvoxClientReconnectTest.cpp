@@ -24,7 +24,7 @@ TEST_F(HalvoxClientReconnectTest, MessagesWaitForAServiceThatIsNotThereYet) {
   EXPECT_FALSE(client.isConnected());
   service_.come();
 
-  // Both flushes wait for the same answer, because no message came between them.
+  // Both flushes wait for the same answer, because no message was sent between them.
   EXPECT_TRUE(client.flush(kPatience));
   EXPECT_EQ(service_.members(), "createReportingSession sendMessage reporterIDValid");
 }
@@ -126,8 +126,8 @@ TEST_F(HalvoxClientReconnectTest, TellsItsHandlerOfEveryConnectionMadeAndLost) {
 
 TEST_F(HalvoxClientReconnectTest, DestructionDoesNotWaitForAServiceThatIsNotThere) {
   service_.vanish();
-  // With a service that stalls, each destruction waits for a second. A busy machine may delay one
-  // of them by as much, but hardly ten in a row.
+  // If destruction waited for the stalled service, it would take a second each time. A busy machine
+  // may delay one destruction by as much, but hardly ten in a row.
   std::chrono::steady_clock::duration fastest = 1h;
   for (int attempt = 0; attempt < 10 && fastest >= 900ms; ++attempt) {
     const auto before = std::chrono::steady_clock::now();
@@ -166,7 +166,7 @@ TEST_F(HalvoxClientReconnectTest, SurvivesAServiceThatComesAndGoesUnderLoad) {
   std::jthread sender([&] {
     for (std::int64_t number = 0; !done; ++number) {
       client.send(7, {{"n", number}}, kPlayback, kStart);
-      // With a full ring, the test would only show that messages are refused.
+      // The ring must not be full. The test would otherwise only show that messages are refused.
       while (!done && client.counters().pending > 64) std::this_thread::yield();
     }
   });

@@ -105,7 +105,7 @@ TEST_F(HalvoxClientTest, ManyOpenStartsDoNotCloseTheWindow) {
   EXPECT_EQ(service_.count("startReportingSessionForID"), 1000U);
 }
 
-// If both sides blocked in writes, this would never end.
+// If both sides blocked while writing, this flush would never end.
 TEST_F(HalvoxClientTest, LargeMessagesInBothDirectionsDoNotDeadlock) {
   HalvoxClient client(options());
   const std::string large(60'000, 'x');
@@ -123,7 +123,8 @@ TEST_F(HalvoxClientTest, LargeMessagesInBothDirectionsDoNotDeadlock) {
 TEST_F(HalvoxClientTest, DestructionDeliversWhatIsPending) {
   {
     HalvoxClient client(options());
-    // Destruction waits at most a second for messages. Connecting must not use up a part of it.
+    // Destruction waits at most a second for messages. Connecting must not use up a part of that
+    // second.
     ASSERT_TRUE(client.flush(kPatience));
     for (int number = 0; number < 500; ++number) {
       client.send(7, {{"n", number}}, kPlayback, kStart);
@@ -291,8 +292,8 @@ TEST_F(HalvoxClientTest, FlushesOfManyThreadsAllEnd) {
   EXPECT_EQ(service_.count("sendMessage"), std::size_t{kThreads} * kEach);
 }
 
-// The connection is the parent's. The child must neither write to it nor wait for a thread that it
-// does not have.
+// The connection belongs to the parent process. The child must neither write to it nor wait for a
+// thread that exists only in the parent.
 TEST_F(HalvoxClientTest, AChildAfterForkLeavesTheParentsConnectionAlone) {
   auto client = std::make_unique<HalvoxClient>(options());
   client->createSession(7);

@@ -15,9 +15,9 @@ namespace {
 namespace dbus = platform::linux_::dbus;
 using Deadline = std::chrono::steady_clock::time_point;
 
-// Long enough to look at the socket once.
+// The shortest time-out. It is long enough to look at the socket once.
 constexpr std::chrono::milliseconds kShortestTimeout{1};
-// Larger durations could overflow the clock's time points.
+// The longest time-out. Larger durations could overflow the clock's time points.
 constexpr std::chrono::milliseconds kLongestTimeout = std::chrono::hours(24 * 365);
 
 std::chrono::milliseconds bounded(std::chrono::milliseconds timeout) {
@@ -30,12 +30,12 @@ Result<T> failed(Failure failure) {
 }
 
 Failure senseless() {
-  return {Failure::Kind::kRefused, "", "the service's answer has not the type that was expected"};
+  return {Failure::Kind::kRefused, "", "the answer of the service does not have the expected type"};
 }
 Failure timedOut() { return {Failure::Kind::kTimedOut, "", "no answer from the service in time"}; }
 Failure ended() { return {Failure::Kind::kNoService, "", "the service ended the connection"}; }
 
-// A frame that answers a call, copied out of the input.
+// A copy of a frame that answers a call.
 struct Reply {
   bool isError = false;
   std::string frame;
@@ -90,8 +90,8 @@ class HalvoxConnection::Impl {
   [[nodiscard]] bool isOpen() const { return connected_.stream.isOpen(); }
   [[nodiscard]] Deadline deadline() const { return std::chrono::steady_clock::now() + timeout_; }
 
-  // Handles what has arrived, or waits for something to arrive, at most until the deadline. Returns
-  // 0 or a negative errno: -ECONNRESET if the connection has ended, -ETIMEDOUT after the deadline.
+  // Waits until bytes arrive or the deadline passes, and handles the bytes. Returns 0 or a negative
+  // errno: -ECONNRESET if the connection has ended, -ETIMEDOUT after the deadline.
   int processUntil(Deadline deadline) {
     ServiceStream& stream = connected_.stream;
     if (!stream.isOpen() || !stream.send()) return -ECONNRESET;
@@ -103,7 +103,7 @@ class HalvoxConnection::Impl {
     return alive && stream.isOpen() ? 0 : -ECONNRESET;
   }
 
-  // Numbers and appends a frame. Returns its number.
+  // Gives a frame the next serial and appends it to the output. Returns the serial.
   std::uint32_t post(std::string&& frame) {
     if (++lastSerial_ == 0) ++lastSerial_;
     setSerial(frame.data(), lastSerial_);
@@ -163,7 +163,7 @@ class HalvoxConnection::Impl {
   ConnectedStream connected_;
   std::chrono::milliseconds timeout_;
   std::uint32_t lastSerial_ = 0;
-  std::uint32_t awaited_ = 0;  // the number of the call that ask() waits for; 0: none
+  std::uint32_t awaited_ = 0;  // the serial of the call that ask() waits for; 0: none
   std::optional<Reply> reply_;
   std::map<ReporterID, HeldReply> heldReplies_;
 };
@@ -228,8 +228,8 @@ Result<bool> HalvoxConnection::startReportingSessionForID(ReporterID id) {
   HeldReply& reply = impl_->heldReplies()[id];
   reply = {.serial = impl_->post(std::move(std::get<std::string>(request))), .answer = {}};
 
-  // The service carries out requests in order: it answers this one after it has carried out the
-  // start. If it refuses the start, that answer has arrived by then.
+  // The service carries out requests in order, and answers this query after it has carried out the
+  // start. If it refuses the start, the error has arrived by then.
   auto query = impl_->ask(makeRequest("reporterIDValid", id));
   if (!query) return failed<bool>(std::move(*query.failure));
   if (reply.answer && !*reply.answer) return *reply.answer;

@@ -2,7 +2,8 @@
 
 namespace halvox::client {
 
-// Joins function objects into one that std::visit() can call with each alternative of a variant.
+// Joins function objects into one object that std::visit() can call with each alternative of a
+// variant.
 template <typename... Cases>
 struct Overloaded : Cases... {
   using Cases::operator()...;

@@ -32,7 +32,7 @@
 
 namespace {
 
-// Counted only on the threads that ask for it.
+// These calls are counted only on threads that ask for it.
 thread_local bool counts = false;
 thread_local int allocations = 0;
 thread_local int locks = 0;
@@ -44,7 +44,7 @@ void countAllocation() {
 
 }  // namespace
 
-// The program's definitions of these functions are used by all libraries in the process.
+// All libraries in the process use these definitions of the program.
 extern "C" {
 void* __libc_malloc(std::size_t size);                     // NOLINT(bugprone-reserved-identifier)
 void* __libc_calloc(std::size_t count, std::size_t size);  // NOLINT(bugprone-reserved-identifier)
@@ -97,7 +97,8 @@ void onSystemCall(int /*signal*/, siginfo_t* /*info*/, void* context) {
 #endif
 }
 
-// From here on every system call of this thread fails and is counted, except those that end it.
+// From here on, every system call of this thread fails and is counted, except the calls that end
+// the thread.
 bool trapSystemCalls() {
   struct sigaction action {};
   action.sa_sigaction = onSystemCall;
@@ -127,7 +128,8 @@ template <typename Work>
 Counts count(const Work& work) {
   Counts result;
   std::thread([&] {
-    // The first allocation of a thread maps memory for the thread. Do not count that.
+    // Allocate before counting begins, because the first allocation of a thread maps memory for the
+    // thread.
     halvox_dictionary_free(halvox_dictionary_new());
     systemCalls = 0;
     result.trapped = trapSystemCalls();
@@ -187,7 +189,7 @@ class RealTimeTest : public testing::Test {
   std::unique_ptr<halvox_dictionary, DictionaryFree> message_;
 };
 
-// Without this the other tests could pass because nothing is counted.
+// Without this test, the other tests could pass because nothing is counted.
 TEST_F(RealTimeTest, SystemCallsAndAllocationsAreCounted) {
   const Counts counted = count([&] {
     syscall(SYS_getpid);
@@ -263,7 +265,8 @@ std::int64_t pageFaults() {
   return usage.ru_minflt;
 }
 
-// More messages wait than ever before, but the client's thread has run since memory became scarce.
+// More messages wait now than ever before. But the client's thread has run since there was little
+// touched memory left, and has touched more.
 TEST(RingMemoryTest, TheConsumerTouchesMemoryBeforeTheProducersNeedIt) {
   constexpr int kMessages = 400;  // one cell of 512 bytes each
   halvox::client::FrameRing ring(8192, std::size_t{4} << 20U);
@@ -281,7 +284,7 @@ TEST(RingMemoryTest, TheConsumerTouchesMemoryBeforeTheProducersNeedIt) {
   EXPECT_LT(pageFaults() - before, 3);  // 36 if the consumer touches nothing
 }
 
-// Bytes of this process that are in memory.
+// Returns how many bytes of this process are resident.
 std::size_t residentBytes() {
   std::size_t size = 0;
   std::size_t resident = 0;
@@ -289,8 +292,8 @@ std::size_t residentBytes() {
   return resident * static_cast<std::size_t>(sysconf(_SC_PAGESIZE));
 }
 
-// Audio programs lock their memory. The usual limit for that is 8 MiB, and everything that a thread
-// or a client maps counts.
+// Audio programs lock their memory. The usual limit of locked memory is 8 MiB, and everything that
+// a thread or a client maps counts towards it.
 TEST(LockedMemoryTest, AClientLeavesMostOfTheUsualLimitToItsProgram) {
   constexpr int kCannotLock = 2;
   const pid_t child = fork();

@@ -22,8 +22,8 @@ constexpr std::string_view kInterface = "com.tarno.halvox.HVReportingServiceProt
 
 // ---- Headers
 
-// A header without its serial and the length of the body: the same bytes for every call of a
-// method.
+// A header without its serial and the length of the body. These bytes are the same for every call
+// of a method.
 struct Header {
   std::array<char, 192> bytes{};
   std::size_t size = 0;
@@ -80,7 +80,7 @@ constexpr Header makeHeader(std::string_view member, std::string_view signature)
 
 constexpr Header kSendMessage = makeHeader("sendMessage", "a{sv}uqaax");
 
-// Appends the header. The length of the body is set at the end of the body.
+// Appends the header and the body, then sets the length of the body in the header.
 template <typename Body>
 void writeFrame(SegmentWriter& writer, const Header& header, const Body& body) {
   char* length = nullptr;

@@ -11,15 +11,15 @@
 #include "client/SegmentWriter.h"
 #include "client/SessionTable.h"
 
-// The requests of the service's protocol as frames of the wire. A frame has the serial 0 until
-// setSerial(). Numbers keep their type, except that a float becomes a double. The elements of an
-// array are variants.
+// These functions encode the requests of the service's protocol as frames of the wire. A frame has
+// the serial 0 until setSerial(). Numbers keep their type, except that a float becomes a double.
+// The elements of an array are encoded as variants.
 namespace halvox::client {
 
-// Refers to the parts of a message, which the caller owns.
+// A message, as references to its parts. The caller owns the parts.
 template <typename Content>
 struct BasicMessageView {
-  // The sessions that it is for; std::nullopt stands for all active ones.
+  // The sessions that the message is for; std::nullopt stands for all started ones.
   std::optional<std::span<const ReporterID>> recipients;
   const Content& message;
   Category category = 0;
@@ -39,8 +39,8 @@ enum class EncodeOutcome : std::uint8_t {
 EncodeOutcome encodeBody(SegmentWriter& writer, const MessageView& message);
 EncodeOutcome encodeBody(SegmentWriter& writer, const EncodedMessageView& message);
 
-// The header of sendMessage. Its size is constant and a multiple of 8. putMessageHeader() writes
-// the header for a body of `bodyBytes`.
+// The size of the header of sendMessage, which is constant and a multiple of 8. putMessageHeader()
+// writes the header for a body of `bodyBytes`.
 extern const std::size_t kMessageHeaderBytes;
 void putMessageHeader(char* frame, std::size_t bodyBytes);
 
@@ -52,9 +52,10 @@ Request makeRequest(const char* member, ReporterID id);
 Request makeRequest(const SessionOperation& operation);
 Request makeRequest(const MessageView& message);
 
-// Sets the serial, which must not be 0, in a frame. At least its first 12 bytes must be at `frame`.
+// Sets the serial of a frame. It must not be 0. At least the first 12 bytes of the frame must be at
+// `frame`.
 void setSerial(char* frame, std::uint32_t serial);
-// Asks the service not to answer this frame.
+// Marks the frame as one that the service must not answer.
 void setNoReplyExpected(char* frame);
 
 }  // namespace halvox::client

@@ -22,7 +22,7 @@ using platform::linux_::UniqueHandle;
 using Bus = UniqueHandle<sd_bus*, sd_bus_close_unref>;
 using BusMessage = UniqueHandle<sd_bus_message*, sd_bus_message_unref>;
 
-// A fixture in which sd-bus, as a server, reads the frames of the encoder.
+// A fixture with an sd-bus server that reads the frames of the encoder.
 class RequestEncoderTest : public testing::Test {
  protected:
   RequestEncoderTest() {
@@ -70,7 +70,7 @@ class RequestEncoderTest : public testing::Test {
     const Value* found = dictionary->dictionary().find("value");
     return found != nullptr ? std::optional(*found) : std::nullopt;
   }
-  // The signature of the variant that holds the value of a dictionary's only entry.
+  // Returns the signature of the variant in a dictionary's only entry.
   std::string signatureOf(const Value& value) {
     sd_bus_message* message = read(messageWith(value));
     const char* contents = nullptr;
@@ -87,7 +87,7 @@ class RequestEncoderTest : public testing::Test {
   BusMessage message_;
 };
 
-// Gives a limited number of segments, each with room for one number of 8 bytes.
+// Provides a limited number of segments, each with space for one number of 8 bytes.
 class SmallSegments final : public SegmentSource {
  public:
   explicit SmallSegments(std::size_t most) : most_(most), words_(most) {}
@@ -215,7 +215,7 @@ TEST_F(RequestEncoderTest, NestingPastTheWiresLimitIsRefused) {
   EXPECT_NE(error->find("nested too deep"), std::string::npos);
 }
 
-// Puts a bad byte at every place of texts whose lengths are around the size of a word.
+// Puts an invalid byte at every place of texts whose lengths are near the size of a word.
 TEST_F(RequestEncoderTest, FindsNulsAndBytesThatAreNotUtf8AtAnyPlace) {
   for (std::size_t size = 1; size <= 20; ++size) {
     const std::string good(size, 'x');

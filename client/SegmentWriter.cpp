@@ -35,7 +35,8 @@ constexpr std::size_t kFirstSegmentBytes = 1024;
 }
 
 Segment HeapSegments::next() {
-  // Each segment is as large as all earlier ones together: a large frame then takes only a few.
+  // Each segment is as large as all earlier ones together. A large frame therefore takes only a few
+  // segments.
   std::size_t bytes = 0;
   for (const auto& segment : segments_) bytes += segment.size() * sizeof(std::uint64_t);
   bytes = std::max(bytes, kFirstSegmentBytes);

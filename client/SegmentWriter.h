@@ -23,7 +23,7 @@ class SegmentSource {
   SegmentSource(const SegmentSource&) = delete;
   SegmentSource& operator=(const SegmentSource&) = delete;
 
-  // Returns the next piece, or an empty one if no room remains.
+  // Returns the next segment, or an empty one if no memory remains.
   virtual Segment next() = 0;
 };
 
@@ -31,23 +31,23 @@ class SegmentSource {
 // frame starts with the first segment. Because segments are multiples of 8, no number crosses from
 // one segment into the next, and an address has the same alignment as its position in the frame.
 //
-// When no room remains, the writer does nothing more, and isFull() returns true. Belongs to one
-// thread. Does not own `source`, which must outlive it.
+// When the source has no segment left, the writer writes nothing more and isFull() returns true.
+// Belongs to one thread. Does not own `source`, which must outlive it.
 class SegmentWriter {
  public:
   explicit SegmentWriter(SegmentSource& source) : source_(source) { extend(); }
 
   [[nodiscard]] bool isFull() const { return full_; }
-  // The number of bytes so far.
+  // Returns the number of bytes written so far.
   [[nodiscard]] std::size_t position() const {
     return before_ + static_cast<std::size_t>(at_ - begin_);
   }
 
-  // Appends zeros. No alignment is larger than 8.
+  // Appends zeros up to the next multiple of `alignment`, which is at most 8.
   void align(std::size_t alignment) {
     while ((reinterpret_cast<std::uintptr_t>(at_) & (alignment - 1)) != 0) *at_++ = 0;
   }
-  // Appends padding, then the number: the alignment of a number is its size.
+  // Appends padding, then the number. The alignment of a number is its size.
   template <typename Number>
   void number(Number number) {
     align(sizeof number);
@@ -56,8 +56,8 @@ class SegmentWriter {
     at_ += sizeof number;
   }
   void bytes(const void* from, std::size_t size);
-  // Appends a length of 0 to be replaced later by replaceLength(). The result is valid as long as
-  // the segments are.
+  // Appends a length of 0, which replaceLength() replaces later. Returns the place of the length,
+  // which is valid as long as the segments.
   [[nodiscard]] char* length() {
     align(sizeof(std::uint32_t));
     if (at_ == end_ && !extend()) return spare_;
@@ -70,8 +70,8 @@ class SegmentWriter {
     std::memcpy(at, &number, sizeof number);
   }
 
-  // For the common case of a part that fits into the current segment: returns where to write, or
-  // null if fewer than `size` bytes are left there. commit() ends the part.
+  // For the common case that a part fits into the current segment. Returns where to write the part,
+  // or null if fewer than `size` bytes are left in the segment. commit() ends the part.
   [[nodiscard]] char* reserve(std::size_t size) {
     return static_cast<std::size_t>(end_ - at_) >= size ? at_ : nullptr;
   }
@@ -86,14 +86,14 @@ class SegmentWriter {
   char* end_ = nullptr;
   std::size_t before_ = 0;  // bytes in earlier segments
   bool full_ = false;
-  alignas(8) char spare_[8] = {};  // where a length goes for which no room remains
+  alignas(8) char spare_[8] = {};  // the place of a length for which no memory remains
 };
 
-// Segments on the heap, for frames that are made where an allocation does not matter.
+// Segments on the heap, for frames whose allocation does not matter.
 class HeapSegments final : public SegmentSource {
  public:
   Segment next() override;
-  // The first `size` bytes of all segments in one piece.
+  // Returns the first `size` bytes of all segments in one piece.
   [[nodiscard]] std::string join(std::size_t size) const;
 
  private:

@@ -4,14 +4,15 @@
 #include <string_view>
 #include <vector>
 
-// Where programs look for the service and its store. The rule is the same for all: only the place
-// that was named, if any; otherwise the user's place if something is there; otherwise the system's.
+// Where programs look for the service and its store. All programs use the same rule. If a place was
+// named, they use only that one. Otherwise they use the user's place if something is there, and
+// otherwise the system's place.
 namespace halvox::client {
 
-// Returns the paths of the service's socket to try, in order; never an empty list. If `named` is
-// not empty, it is the only one. Otherwise, if $HALVOX_SOCKET is set, that is the only one.
-// Otherwise the list has the user's socket, if $XDG_RUNTIME_DIR is an absolute path, then the
-// system's.
+// Returns the paths at which to try the service's socket, in order. The list is never empty. If
+// `named` is not empty, it is the only path. Otherwise, if $HALVOX_SOCKET is set, that is the only
+// path. Otherwise the list has the user's socket, if $XDG_RUNTIME_DIR is an absolute path, and then
+// the system's socket.
 std::vector<std::string> socketPlaces(std::string_view named = {});
 
 // A place that was tried without success, with the errno of the attempt.
@@ -20,9 +21,9 @@ struct TriedPlace {
   int error = 0;
 };
 
-// Returns true if the errno means that nothing is at a place and the next one is to be tried: the
-// file does not exist, or no process listens on the socket. Any other error concerns something that
-// exists.
+// Returns true if the errno means that nothing is at a place: the file does not exist, or no
+// process listens on the socket. The next place is tried then. Any other error concerns something
+// that exists.
 bool meansAbsence(int error);
 
 // Returns "no service found; tried A (No such file or directory), then B (Connection refused)", or

@@ -18,12 +18,12 @@ namespace dbus = platform::linux_::dbus;
 using platform::linux_::UniqueFd;
 
 constexpr std::size_t kReadBytes = std::size_t{16} * 1024;
-// All lines of our side at once: the service reads the later ones after it has agreed. The identity
-// is omitted, because the service takes it from the socket. Inside a user namespace it would also
-// be a different one than outside.
+// All lines of our side, sent at once. The service reads the later ones after it has agreed. The
+// identity is omitted, because the service takes it from the socket, and because inside a user
+// namespace it would be a different one than outside.
 constexpr std::string_view kHandshake{"\0AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n", 29};
 
-// Connects a non-blocking stream to a socket. On failure the second member is the errno.
+// Connects a non-blocking stream to a socket. After a failure the second member is the errno.
 std::pair<UniqueFd, int> connectSocket(const std::string& socketPath) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -32,8 +32,8 @@ std::pair<UniqueFd, int> connectSocket(const std::string& socketPath) {
 
   UniqueFd fd(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
   if (!fd) return {UniqueFd(), errno};
-  // If the backlog is full, this fails with EAGAIN. A stalled service therefore does not block the
-  // caller.
+  // If the backlog is full, connect() fails with EAGAIN. A stalled service therefore does not block
+  // the caller.
   if (connect(fd.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) < 0) {
     return {UniqueFd(), errno};
   }
@@ -48,8 +48,9 @@ std::uint32_t numberAt(std::span<const std::byte> bytes, std::size_t offset) {
   return number;
 }
 
-// Recognises a success answer that begins as the service's answers do: in the byte order of this
-// machine, and with the number of the call as the first field. Returns false for any other.
+// Recognises an answer without an error that begins like the answers of the service: in the byte
+// order of this machine, and with the serial of the call as the first field. Returns false for any
+// other frame.
 bool readPlainAnswer(std::span<const std::byte> input, NextFrame& next) {
   constexpr std::size_t kFieldsStart = dbus::kFrameStartBytes;
   constexpr std::size_t kReplySerialEnd = kFieldsStart + 8;
@@ -118,8 +119,8 @@ bool ServiceStream::receive() {
   return isOpen();
 }
 
-// The service first asks for the identity, with the line "DATA", and then agrees, with "OK". The
-// client has already sent its answer.
+// The service first asks for the identity with the line "DATA", and then agrees with "OK". The
+// client has sent its answer to "DATA" already.
 void ServiceStream::continueHandshake() {
   auto rest = input();
   while (!ready_ && line_.take(rest)) {

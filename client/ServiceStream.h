@@ -23,27 +23,29 @@ namespace halvox::client {
 //   closed ──connectToService()──► handshake ──► ready ──► ended
 //                                      └───────────────────▲
 //
-// Once it is ready, the owner appends frames and calls send() to write everything that has gathered
-// in one system call. (Some servers overlook frames that arrive in one piece with the end of the
-// handshake.) receive() reads what has arrived; the owner then takes frames out of input(). Both
-// return false once the connection has ended. Belongs to one thread at a time.
+// When the stream is ready, the owner appends frames and calls send(), which writes all of them in
+// one system call. The owner must not send frames earlier, because some servers overlook frames
+// that arrive in one piece with the end of the handshake. receive() reads the bytes that have
+// arrived; the owner then takes frames out of input(). send() and receive() return false if the
+// connection has ended. Belongs to one thread at a time.
 class ServiceStream {
  public:
   ServiceStream() = default;
   explicit ServiceStream(platform::linux_::UniqueFd connected);
 
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(fd_) && !ended_; }
-  // Returns true once the service has agreed to the handshake.
+  // Returns true if the service has agreed to the handshake.
   [[nodiscard]] bool isReady() const { return ready_; }
   // Returns the argument for poll(2): waits for `events`, and for POLLOUT while output is unsent.
   [[nodiscard]] pollfd polled(short events) const {
     return {fd_.get(), static_cast<short>(hasOutput() ? events | POLLOUT : events), 0};
   }
-  // True while appended bytes wait for send(), or for the socket to become writable.
+  // Returns true while appended bytes wait for send() or for the socket to become writable.
   [[nodiscard]] bool hasOutput() const { return sent_ < output_.size(); }
   [[nodiscard]] std::size_t outputBytes() const { return output_.size() - sent_; }
 
-  // Appends room for `size` bytes of frames, and returns it.
+  // Appends `size` bytes to the output, and returns their address. The caller writes the frame
+  // there.
   char* append(std::size_t size);
   void append(std::string_view frame) { frame.copy(append(frame.size()), frame.size()); }
   bool send();
@@ -51,8 +53,8 @@ class ServiceStream {
   // Ends the connection from this side, without closing the socket yet.
   void end() { ended_ = true; }
 
-  // Returns the bytes that were received and not yet consumed. They begin with a frame once the
-  // handshake is done.
+  // Returns the bytes that were received and not yet consumed. After the handshake they begin with
+  // a frame.
   [[nodiscard]] std::span<const std::byte> input() const;
   void consume(std::size_t bytes) { consumed_ += bytes; }
 
@@ -70,7 +72,7 @@ class ServiceStream {
   std::size_t consumed_ = 0;
 };
 
-// A connection, its place, and the places that were tried before without finding a service.
+// A connection, its place, and the places that were tried before it and had no service.
 struct ConnectedStream {
   ServiceStream stream;
   std::string place;
@@ -78,8 +80,8 @@ struct ConnectedStream {
 };
 
 // Connects to the first of the places at which a service listens. `places` must not be empty. Does
-// not wait for the service: the handshake follows. A service that exists but cannot be reached ends
-// the search. The failure names the places that were tried.
+// not wait for the service, and returns before the handshake. If a service exists but cannot be
+// reached, the search ends. The failure names the places that were tried.
 std::variant<ConnectedStream, Failure> connectToService(const std::vector<std::string>& places);
 
 // The header of an answer.
@@ -102,8 +104,8 @@ struct NextFrame {
   Answer answer;
 };
 
-// Looks at the first frame. The plain answers of the service are recognised by their first bytes;
-// any other header is read and checked. Bodies are not read.
+// Looks at the first frame of `input`. Recognises the usual answers of the service by their first
+// bytes. Reads and checks the header of any other frame. Does not read bodies.
 NextFrame nextFrame(std::span<const std::byte> input);
 
 }  // namespace halvox::client

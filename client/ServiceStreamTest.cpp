@@ -45,7 +45,7 @@ TEST(NextFrameTest, KnowsErrorsFromOtherAnswers) {
 TEST(NextFrameTest, FindsTheNumberOfTheCallBehindOtherFields) {
   std::string frame;
   ASSERT_TRUE(dbus::appendMethodReturn(frame, {79, ":1.5"}, 3, "", {}));
-  // Swaps the two header fields.
+  // Swaps the two fields of a frame's header.
   const std::string serialField = frame.substr(16, 8);
   frame.erase(16, 8);
   while (frame.size() % 8 != 0) frame += '\0';

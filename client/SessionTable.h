@@ -10,7 +10,7 @@
 
 namespace halvox::client {
 
-// One step of a session's life: one request to the service.
+// One step of a session's life, which is one request to the service.
 struct CreateSession {};
 struct DestroySession {};
 struct StartSession {};
@@ -22,19 +22,19 @@ struct SessionOperation {
   SessionStep step;
 };
 
-// The state of a service after a sequence of operations: its sessions with their type and
-// configuration, and whether they run. remake() gives the operations that bring a new service to
-// the same state. Plain data; the owner provides locking. Grows only with the program's own
+// The state of a service after a sequence of operations: its sessions, with their types and
+// configurations, and which of them run. remake() returns the operations that bring a new service
+// to the same state. Plain data; the owner provides locking. Grows only with the program's own
 // sessions.
 class SessionTable {
  public:
-  // Applies the service's rules: creating a session again replaces it, configurations are merged,
-  // and operations on an unknown session do nothing.
+  // Applies an operation by the rules of the service: creating a session again replaces it,
+  // configurations are merged, and operations on an unknown session do nothing.
   void apply(const SessionOperation& operation);
   // Returns the operations that make all these sessions, in the order of their creation.
   [[nodiscard]] std::vector<SessionOperation> remake() const;
   [[nodiscard]] std::size_t size() const { return sessions_.size(); }
-  // The number of sessions that are started and not stopped.
+  // Returns the number of sessions that are started and not stopped.
   [[nodiscard]] std::size_t running() const { return running_; }
 
  private:

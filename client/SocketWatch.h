@@ -8,20 +8,20 @@
 namespace halvox::client {
 
 // Reports when a file appears under the name of one of several sockets. The client then connects to
-// a new service at once instead of waiting for its next attempt. Watches only between begin() and
-// end(): changes in the directories must not wake a connected client. Belongs to one thread.
-// Reports nothing for a directory that does not exist, or if inotify is not available; the client
-// then relies on its attempts.
+// a new service at once and does not wait for its next attempt. Watches only between begin() and
+// end(), because changes in the directories must not wake a connected client. Belongs to one
+// thread. Reports nothing for a directory that does not exist, or if inotify is not available. The
+// client then connects at its next attempt.
 class SocketWatch {
  public:
   explicit SocketWatch(const std::vector<std::string>& socketPaths);
 
-  // Starts to watch. Tries again for directories that did not exist before.
+  // Starts to watch, including directories that did not exist at an earlier call.
   void begin();
   void end();
-  // The descriptor to poll for reading; -1 if there is nothing to watch.
+  // Returns the descriptor to poll for reading; -1 while nothing is watched.
   [[nodiscard]] int fd() const { return fd_.get(); }
-  // Reads the pending events. Returns true if one of the names has appeared.
+  // Reads the pending events. Returns true if a file has appeared under one of the names.
   bool takeAppeared();
 
  private:

@@ -11,12 +11,12 @@
 #include "platform/linux/connection/wire/Frame.h"
 #include "platform/value.h"
 
-// Encodes values as bytes of a request. The code is inline in a header because the caller's thread
-// pays for every function call. Only RequestEncoder.cpp includes it.
+// Encodes values as bytes of a request. The code is inline in a header because every function call
+// costs time on the caller's thread. Only RequestEncoder.cpp includes this header.
 namespace halvox::client {
 
-// Appends values and remembers why one cannot be sent. If `path` is not null, stores the place of
-// that value in the message there.
+// Appends values. If a value cannot be sent, remembers the reason, and stores the place of the
+// value in the message in `path` unless that is null.
 class ValueWriter {
  public:
   explicit ValueWriter(SegmentWriter& writer, std::string* path = nullptr)
@@ -60,7 +60,7 @@ class ValueWriter {
     SegmentWriter::replaceLength(length, bytes);
     return leave();
   }
-  // When no room remains, writing the rest of a large message would only take time.
+  // Stop when no memory remains. Writing the rest of a large message would only take time.
   [[nodiscard]] bool mayGoOn() const { return !writer_.isFull(); }
 
   void notePlace(std::string_view key) {
@@ -76,8 +76,8 @@ class ValueWriter {
 
   bool appendEntry(std::string_view key, const Value& value) {
     if (!isWireText(key)) return fail("the key is not UTF-8 without NUL");
-    // The fast path: nearly all values are numbers and short texts, and their entries fit into the
-    // current segment.
+    // This is the fast path. Nearly all values are numbers and short texts, and their entries fit
+    // into the current segment.
     const std::string_view text = value.string();
     char* at = writer_.reserve(key.size() + text.size() + kEntryRoom);
     if (at != nullptr && depth_ < platform::linux_::dbus::kMaxNesting) {
@@ -135,8 +135,8 @@ class ValueWriter {
 
   bool appendNumber(const Value& value) {
     if (!enter()) return false;
-    // The padding depends on where the value begins. Encode it here at the same offset from a
-    // multiple of 8.
+    // The padding depends on where the value begins. Encode the value at the same offset from a
+    // multiple of 8 as its place in the message.
     alignas(8) std::array<char, 8 + kNumberRoom> made{};
     const std::size_t misaligned = writer_.position() % 8;
     const char* const end = putNumber(made.data() + misaligned, value);

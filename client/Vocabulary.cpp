@@ -86,7 +86,8 @@ std::string_view nameOf(std::span<const NamedNumber> table, std::uint32_t number
   return found == table.end() ? otherwise : found->name;
 }
 
-// Every category proper without a name is called "Undefined". The number 0 stands for all of them.
+// Every category without a name (apart from its domain) is called "Undefined". The number 0 stands
+// for all of them.
 std::optional<std::uint32_t> findCategoryProper(std::string_view name) {
   if (equalIgnoringCase(name, kUndefined)) return 0;
   return find(kCategories, name);

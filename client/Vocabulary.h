@@ -100,14 +100,15 @@ std::span<const NamedNumber> categories();
 std::span<const NamedNumber> eventTypes();
 std::span<const NamedNumber> serviceTypes();
 
-// Return the name of a number in the service's spelling: "Session_Playback", "Start", "telephony".
-// Numbers without a name: a category is "Undefined", with its domain as a prefix if it has one; an
-// event type is "Generic"; a service type is "telephony".
+// These functions return the name of a number in the service's spelling, such as
+// "Session_Playback", "Start" or "telephony". If a number has no name, a category is "Undefined",
+// with its domain as a prefix if it has one, an event type is "Generic", and a service type is
+// "telephony".
 std::string categoryName(Category category);
 std::string_view eventTypeName(EventType type);
 std::string_view serviceTypeName(ServiceType type);
 
-// Return the number of a name, ignoring case; std::nullopt for an unknown name.
+// These functions return the number of a name, ignoring case; std::nullopt for an unknown name.
 std::optional<Category> findCategory(std::string_view name);
 std::optional<EventType> findEventType(std::string_view name);
 std::optional<ServiceType> findServiceType(std::string_view name);

@@ -8,14 +8,15 @@
 #include "platform/linux/base/Utf8.h"
 #include "platform/value.h"
 
-// The parts of which values are made on the wire: texts, padding, signatures and numbers. Each
-// function writes at an address whose alignment is that of its place in the frame, and returns the
-// end. The code is inline because the caller's thread pays for every function call.
+// Functions that write the parts of values on the wire: texts, padding, signatures and numbers.
+// Each function writes at an address that has the same alignment as its place in the frame, and
+// returns the end of what it wrote. The code is inline because every function call costs time on
+// the caller's thread.
 namespace halvox::client {
 
 inline constexpr std::uint64_t kEachHighBit = 0x8080808080808080;
 
-// Sets the high bit of each byte that is a NUL or not ASCII, and sometimes that of the byte after a
+// Sets the high bit of each byte that is a NUL or not ASCII. May also set that of the byte after a
 // NUL.
 inline std::uint64_t highBits(std::uint64_t word) {
   constexpr std::uint64_t kEachByte = 0x0101010101010101;
@@ -29,8 +30,8 @@ inline Number load(const char* from) {
   return number;
 }
 
-// Returns true for ASCII without NUL. Nearly all texts are, and need not go through the full test,
-// which checks the last bytes one by one.
+// Returns true if the text is ASCII without NUL. Nearly all texts are, and are spared the full
+// test, which checks the last bytes one by one.
 inline bool isPlainText(std::string_view text) {
   constexpr std::size_t kWord = sizeof(std::uint64_t);
   const auto signs = [&](std::size_t at) {
@@ -50,7 +51,8 @@ inline bool isWireText(std::string_view text) {
   return isPlainText(text) || platform::linux_::isUtf8WithoutNul(text);
 }
 
-// Copies a text. The length is usually small and not a constant; memcpy() would be a function call.
+// Copies a text. The length is usually small and not a constant, and memcpy() would therefore be a
+// function call.
 inline char* copyText(char* to, std::string_view text) {
   const std::size_t size = text.size();
   if (size >= 8 && size <= 32) {
@@ -68,8 +70,8 @@ inline char* copyText(char* to, std::string_view text) {
   return to + size + 1;
 }
 
-// Appends zeros up to a multiple of 8 or 4. Always writes 8 bytes, of which the last may lie beyond
-// the result.
+// Appends zeros up to a multiple of 8 or 4, and returns that address. Always writes 8 bytes; the
+// last of them may be after the returned address.
 inline char* padded(char* at, std::size_t alignment) {
   std::memset(at, 0, 8);
   return at + ((0 - reinterpret_cast<std::uintptr_t>(at)) & (alignment - 1));
@@ -81,8 +83,8 @@ inline char* put(char* at, Number number) {
   return at + sizeof number;
 }
 
-// Appends the signature of one basic type. Also writes a zero after it: four bytes are one store,
-// whereas three would go through the stack.
+// Appends the signature of one basic type, which has three bytes. Also writes a zero after it,
+// because four bytes are one store, whereas three bytes would go through the stack.
 inline char* putSignature(char* at, char type) {
   const char bytes[4] = {1, type, 0, 0};
   std::memcpy(at, bytes, sizeof bytes);
@@ -125,9 +127,9 @@ inline char* putKey(char* at, std::string_view key) {
   return copyText(put(padded(at, 8), static_cast<std::uint32_t>(key.size())), key);
 }
 
-// Signature, padding and number need at most this much, including what padded() writes.
+// The most bytes that a signature, padding and a number need, including those that padded() writes.
 constexpr std::size_t kNumberRoom = 24;
-// The room that an entry needs in addition to its texts: padding, two lengths, two NULs and a
+// The bytes that an entry needs in addition to its texts: padding, two lengths, two NULs and a
 // signature.
 constexpr std::size_t kEntryRoom = 16 + kNumberRoom;
 

@@ -11,15 +11,15 @@
 #include "client/WireParts.h"
 #include "platform/value.h"
 
-// Single values before they are encoded. Each type refers to its content, which the caller owns,
-// and has three functions:
+// Single values before they are encoded. Each type refers to its content, which the caller owns.
+// There are three functions for each type:
 //
 //   putVariant()     writes the variant of the value, and returns the end
 //   variantRoom()    the most bytes that putVariant() touches
 //   variantLevels()  the levels of nesting of the variant
 namespace halvox::client {
 
-// The most levels that are counted. It is more than the wire allows.
+// Levels of nesting are counted only up to this number, which is more than the wire allows.
 inline constexpr unsigned kMostLevels = 255;
 
 struct WireNumber {
@@ -52,8 +52,8 @@ WireNumber makeWireNumber(char type, Number number) {
   return made;
 }
 
-// Returns the number in the type that it has on the wire: its own, except that a signed byte is
-// sent as 16 bits and a float as a double.
+// Returns the number in the type that it has on the wire. A number keeps its type, except that a
+// signed byte is sent as 16 bits and a float as a double.
 template <platform::ArithmeticNumber Number>
 WireNumber wireNumber(Number number) {
   if constexpr (std::same_as<Number, bool>) {
@@ -93,7 +93,8 @@ inline char* putVariant(char* at, platform::Date date) {
 inline std::size_t variantRoom(platform::Date /*date*/) { return kNumberRoom; }
 inline unsigned variantLevels(platform::Date /*date*/) { return 2; }
 
-// A length on the wire. A longer message is refused before it is sent.
+// Writes padding and a length of 32 bits. A message that would need a longer one is refused before
+// it is sent.
 inline char* putLength(char* at, std::size_t length) {
   return put(padded(at, 4), static_cast<std::uint32_t>(length));
 }
@@ -117,7 +118,7 @@ inline std::size_t variantRoom(const WireData& data) { return data.bytes.size() 
 inline unsigned variantLevels(const WireData& /*data*/) { return 2; }
 
 inline char* putVariant(char* at, const WireArray& array) {
-  // The length is after up to 3 bytes of padding, and the elements are after the length.
+  // Up to 3 bytes of padding come first, then the length, then the elements.
   at = padded(putLongSignature(at, "av"), 4);
   const bool beginsAtEight = reinterpret_cast<std::uintptr_t>(at) % 8 == 4;
   const auto elements = beginsAtEight ? array.atEight : array.atFour;

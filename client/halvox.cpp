@@ -14,8 +14,8 @@
 #include "client/HalvoxClient.h"
 #include "client/Vocabulary.h"
 
-// The handles are plain structs around the C++ objects. No exception may leave this file. The
-// functions that are called here throw only if memory or threads are exhausted.
+// The handles are plain structs around the C++ objects. No exception may leave this file. The C++
+// functions that it calls throw only if there is no memory or no thread left.
 
 namespace client = halvox::client;
 using halvox::platform::Date;
@@ -50,7 +50,7 @@ halvox_result done(Work&& work) noexcept {
   });
 }
 
-// The bytes of a data value; std::nullopt if there is no address.
+// Returns the bytes of a data value; std::nullopt if `bytes` is null although `size` is not 0.
 std::optional<std::span<const std::byte>> bytesAt(const void* bytes, size_t size) {
   if (bytes == nullptr && size > 0) return std::nullopt;
   return std::span(static_cast<const std::byte*>(bytes), size);
@@ -78,7 +78,7 @@ size_t fill(std::string_view text, char* buffer, size_t size) {
   return text.size();
 }
 
-// Copies a caller's struct, which is shorter if the caller was built with an earlier version.
+// Copies a struct of the caller. It is shorter if the caller was built with an earlier version.
 template <typename Struct>
 Struct takeStruct(const Struct& given) {
   Struct full{};
@@ -136,7 +136,7 @@ size_t halvox_category_name(uint32_t category, char* buffer, size_t size) {
   return fill(client::categoryName(category), buffer, size);
 }
 
-// The names are string literals, whose characters end with a NUL.
+// The names are string literals. They therefore end with a NUL.
 const char* halvox_event_type_name(uint16_t type) { return client::eventTypeName(type).data(); }
 
 const char* halvox_service_type_name(uint16_t type) { return client::serviceTypeName(type).data(); }

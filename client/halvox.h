@@ -152,8 +152,8 @@ enum {
  * be NULL. A category without a name is "Undefined", after its domain if it has one. */
 HALVOX_API size_t halvox_category_name(uint32_t category, char* buffer, size_t size);
 /* Return the name of an event type or a service type, such as "Start" or "telephony". The texts are
- * static. Types without a name give "Generic", service types without one give "telephony", as in
- * the service. */
+ * static. As in the service, an event type without a name is "Generic", and a service type without
+ * a name is "telephony". */
 HALVOX_API const char* halvox_event_type_name(uint16_t type);
 HALVOX_API const char* halvox_service_type_name(uint16_t type);
 
@@ -224,13 +224,13 @@ HALVOX_API halvox_result halvox_array_append_array(halvox_array* array, const ha
 /* ---- The client ----------------------------------------------------------------------------- */
 
 /* How a client works. Set `size` to sizeof(halvox_options) and all other fields to 0 for their
- * defaults. `size` tells the library which fields this program knows: fields that a later version
+ * defaults. `size` tells the library which fields this program knows. Fields that a later version
  * adds then have their defaults. */
 typedef struct halvox_options {
   size_t size;
   const char* socket_path;       /* NULL: the usual places, see halvox_default_socket_path() */
   uint64_t max_pending_messages; /* messages that may wait for the client's thread; 0: 8192 */
-  uint64_t max_pending_bytes;    /* their memory, each a multiple of 512; 0: 4 MiB */
+  uint64_t max_pending_bytes;    /* memory of these messages, a multiple of 512 each; 0: 4 MiB */
   uint32_t request_timeout_ms;   /* how long making a connection may take; 0: 5000 */
   uint32_t reconnect_min_ms;     /* first pause between attempts to connect; 0: 50 */
   uint32_t reconnect_max_ms;     /* longest pause, after several attempts; 0: 2000 */
@@ -244,16 +244,16 @@ typedef struct halvox_counters {
   uint64_t dropped;      /* a send function returned HALVOX_DROPPED */
   uint64_t acknowledged; /* answered by the service without an error */
   uint64_t refused;      /* answered with an error, or not representable on the wire */
-  uint64_t lost;         /* in flight when a connection ended; the service may have received them.
-                            Also messages that waited when 8,192 session operations had piled up
-                            without a service */
+  uint64_t lost;         /* sent but not answered when a connection ended; the service may have
+                            received them. Also messages that were discarded because 8,192 session
+                            operations were waiting without a service */
   uint64_t pending;      /* waiting or in flight */
   uint64_t reconnects;   /* connections made after the first one */
 } halvox_counters;
 
-/* Called when the connection is made (true) or lost (false), on the client's thread, which sends
- * nothing until the handler returns and has a stack of 512 KiB. It must not block or call
- * halvox_client_free(). */
+/* Called when the connection is made (true) or lost (false). The handler runs on the client's
+ * thread, which has a stack of 512 KiB and sends nothing until the handler returns. The handler
+ * must not block or call halvox_client_free(). */
 typedef void (*halvox_connection_handler)(bool connected, void* user_data);
 
 /* Writes the path of the socket where a client with default options looks for the service now:
@@ -332,8 +332,8 @@ HALVOX_API halvox_result halvox_client_send_to_all(halvox_client* client,
 HALVOX_API halvox_result halvox_client_flush(halvox_client* client, uint32_t timeout_ms);
 /* Returns true while a connection to the service exists. Never blocks. */
 HALVOX_API bool halvox_client_is_connected(const halvox_client* client);
-/* Stores the counters of this moment. Set `counters->size` first: only fields within that size are
- * written. Never blocks. */
+/* Stores the current counters. Set `counters->size` before the call, because only fields within
+ * that size are written. Never blocks. */
 HALVOX_API halvox_result halvox_client_counters(const halvox_client* client,
                                                 halvox_counters* counters);
 /* Sets the function to call when the connection is made or lost. If there is a connection already,

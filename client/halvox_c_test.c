@@ -10,7 +10,7 @@ static int failures = 0;
 #define CHECK(condition)                                                      \
   do {                                                                        \
     if (!(condition)) {                                                       \
-      fprintf(stderr, "%s:%d: not so: %s\n", __FILE__, __LINE__, #condition); \
+      fprintf(stderr, "%s:%d: failed: %s\n", __FILE__, __LINE__, #condition); \
       ++failures;                                                             \
     }                                                                         \
   } while (0)
@@ -69,7 +69,7 @@ static halvox_dictionary* make_dictionary(void) {
   CHECK(halvox_dictionary_set_int64(inner, "inside", 1) == HALVOX_OK);
   CHECK(halvox_dictionary_set_dictionary(dictionary, "dictionary", inner) == HALVOX_OK);
   CHECK(halvox_dictionary_set_array(dictionary, "array", array) == HALVOX_OK);
-  CHECK(halvox_dictionary_set_int64(inner, "inside", 2) == HALVOX_OK); /* not seen outside */
+  CHECK(halvox_dictionary_set_int64(inner, "inside", 2) == HALVOX_OK); /* not in the copy */
   CHECK(halvox_dictionary_set_bool(dictionary, "gone", true) == HALVOX_OK);
   CHECK(halvox_dictionary_remove(dictionary, "gone"));
   CHECK(!halvox_dictionary_remove(dictionary, "gone"));

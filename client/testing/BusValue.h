@@ -6,8 +6,8 @@
 
 struct sd_bus_message;
 
-// Reads messages with sd-bus: a check that shares no code with the library. Reads arrays of any
-// type, and unwraps variants.
+// Reads messages with sd-bus, which shares no code with the library. Reads arrays of any type, and
+// unwraps variants.
 namespace halvox::client {
 
 // Reads the next complete value of the message, of any type. Returns std::nullopt at the end of the

@@ -1,4 +1,4 @@
-# Fails if the library needs another one than those of the C library.
+# Fails if the library needs other libraries than those of the C library.
 execute_process(COMMAND ${READELF} --dynamic --wide ${LIBRARY}
   OUTPUT_VARIABLE dynamic COMMAND_ERROR_IS_FATAL ANY)
 string(REGEX MATCHALL "Shared library: \\[[^]]*\\]" needed "${dynamic}")

@@ -166,7 +166,7 @@ void TestService::accept() {
 }
 
 void TestService::serve(Connection& connection) {
-  // After a failure, run() drops the closed bus.
+  // If sd_bus_process() fails, close the bus. run() then drops it.
   int result = 0;
   do {
     result = sd_bus_process(connection.bus.get(), nullptr);

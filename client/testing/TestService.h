@@ -26,9 +26,9 @@ struct RecordedCall {
   std::vector<Value> arguments;
 };
 
-// Stands in for the reporting service in tests of clients. It answers as the protocol says and
-// records every request. A test can make it stall, refuse requests, vanish and come back. One
-// thread of its own serves all connections. Any thread may call the public operations.
+// Replaces the reporting service in tests of clients. It answers as the protocol requires, and
+// records every request. A test can make it stall, refuse requests, vanish and come back. A thread
+// of its own serves all connections. Any thread may call the public functions.
 class TestService {
  public:
   // Listens on that socket at once.
@@ -37,7 +37,7 @@ class TestService {
   TestService(const TestService&) = delete;
   TestService& operator=(const TestService&) = delete;
 
-  // A stalled service keeps its connections but reads nothing from them and accepts none.
+  // A stalled service keeps its connections, but reads nothing from them and accepts no new ones.
   void setStalled(bool stalled);
   // Ends every connection and removes the socket; come() listens again.
   void vanish();
@@ -100,7 +100,7 @@ class TestService {
   std::jthread thread_;
 };
 
-// For the tests of clients, which use these without naming the namespace.
+// The tests of clients use these names without their namespace.
 using platform::linux_::eventually;
 using platform::linux_::ScratchDirectory;
 
