@@ -135,8 +135,8 @@ bool ClientWorker::flush(std::chrono::milliseconds timeout) {
   {
     const MutexLock lock(mutex_);
     const std::uint64_t position = ring_.tail();
-    // Flushes share a ticket if nothing was handed over between them. Otherwise they could fill the
-    // lane.
+    // Flushes share a ticket if nothing was posted or sent between them. Otherwise flushes alone
+    // could fill the lane.
     const bool shares = !lane_.empty() && lane_.back().position == position &&
                         std::holds_alternative<FlushTicket>(lane_.back().step);
     if (!shares) {

@@ -12,7 +12,7 @@ using platform::linux_::MutexLock;
 // How many calls may be open. This is enough to keep the service busy, and few enough that the
 // outcome of a message is known soon.
 constexpr std::size_t kMaxOpenCalls = 256;
-// The same limit in bytes. A single larger message is allowed.
+// How many bytes the messages of the open calls may have. A single message may be larger.
 constexpr std::size_t kMaxOpenBytes = std::size_t{4} << 20U;
 // A full window opens again when half of its calls are answered. This makes writes fewer and
 // larger.
@@ -39,7 +39,8 @@ void ClientWorker::tryConnect() {
   }
   pauseBeforeRetry();
   if (!closing_.load(std::memory_order_relaxed)) return;
-  // The destructor need not wait longer, because no service can receive the pending messages.
+  // The client is being destroyed. The destructor need not wait longer, because there is no service
+  // for the pending messages.
   const MutexLock lock(mutex_);
   endNow_ = true;
   flushed_.notifyAll();

@@ -45,7 +45,7 @@ class EncodedArray {
   }
 
  private:
-  // The bytes before the elements in `atFour_`.
+  // How many bytes there are before the first element in `atFour_`.
   static constexpr std::size_t kFour = 4;
 
   void reserve(std::size_t room);

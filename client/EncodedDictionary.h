@@ -113,7 +113,7 @@ class EncodedDictionary {
   ByteBuffer<512> bytes_;
   Entries entries_;
   unsigned levels_ = 0;  // of the deepest value
-  // Each key that was ever set has set the bit that its hash chooses. For most new keys this bit is
+  // Bit n is set if a key whose hash is n modulo 64 was ever stored. For most new keys the bit is
   // not set, and they need no comparison.
   std::uint64_t seen_ = 0;
   // Used only by a large dictionary. Has the index of each entry plus 1, at a place that the

@@ -250,7 +250,7 @@ TEST(EncodedDictionaryTest, KeysThatDifferInOneByteAreDifferent) {
   }
 }
 
-// 32 dictionaries and the variants in them.
+// There are 64 levels: 32 dictionaries and the variants in them.
 TEST(EncodedDictionaryTest, NestingIsTakenUpToTheWiresLimit) {
   EncodedDictionary message;
   EncodedDictionary flat;

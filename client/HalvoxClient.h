@@ -40,7 +40,7 @@ struct Failure {
   std::string message;  // one line for a person
 };
 
-// Either a value or a failure, never both. Converts to true if there is a value.
+// Has either a value or a failure, never both. Converts to true if there is a value.
 template <typename T>
 struct Result {
   std::optional<T> value;
@@ -209,8 +209,9 @@ class HalvoxConnection {
   Result<Dictionary> reporterIDValid(ReporterID id);
   // Returns the IDs of the sessions of all clients.
   Result<std::vector<ReporterID>> getAllReporters();
-  // Ends the service. The service does not answer; true means that the connection ended. Only root
-  // and the user that the service runs as may do this; others are refused.
+  // Ends the service. The service does not answer this request. The result true means that the
+  // connection has ended. Only root and the user that the service runs as may do this; others are
+  // refused.
   Result<bool> killService();
 
  private:
@@ -219,9 +220,10 @@ class HalvoxConnection {
   std::unique_ptr<Impl> impl_;
 };
 
-// Returns where a client with default options looks for the service now: $HALVOX_SOCKET, else
-// $XDG_RUNTIME_DIR/halvox/reporting.sock if that exists, else /run/halvox/reporting.sock if that
-// exists, else the first of these that is defined. Does not connect.
+// Returns the socket where a client with default options looks for the service now. This is
+// $HALVOX_SOCKET if it is set, or else the first of $XDG_RUNTIME_DIR/halvox/reporting.sock and
+// /run/halvox/reporting.sock that exists. If neither exists, it is the first of these two that is
+// defined. Does not connect.
 std::string defaultSocketPath();
 
 }  // namespace halvox::client

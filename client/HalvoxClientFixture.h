@@ -27,7 +27,7 @@ class HalvoxClientFixture : public testing::Test {
             .reconnectMin = std::chrono::milliseconds(5),
             .reconnectMax = std::chrono::milliseconds(100)};
   }
-  // Returns the numbers "n" of all messages that arrived, in their order.
+  // Returns the numbers under the key "n" in all messages that arrived, in their order.
   std::vector<std::int64_t> numbersReceived() {
     std::vector<std::int64_t> numbers;
     for (const auto& call : service_.calls()) {

@@ -45,8 +45,8 @@ struct Reply {
     const auto* valid = std::get_if<dbus::Frame>(&frameOrError);
     return valid != nullptr ? *valid : dbus::Frame{};
   }
-  // Returns the value of an answer with one value of that signature; std::nullopt for any other
-  // answer.
+  // If the answer has exactly one value, of that signature, returns the value; otherwise
+  // std::nullopt.
   [[nodiscard]] std::optional<Value> value(std::string_view signature) const {
     std::vector<Value> values;
     if (dbus::decodeBody(read(), signature, values) || values.size() != 1) return std::nullopt;

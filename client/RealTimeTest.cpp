@@ -1,5 +1,5 @@
-// Tests what audio threads rely on: counts the system calls, allocations and locks of a thread that
-// sends through the shared library, as a program would.
+// Tests what audio threads rely on. Counts the system calls, allocations and locks of a thread that
+// sends through the shared library, as a thread of a program does.
 
 #include <atomic>
 #include <cerrno>

@@ -9,7 +9,7 @@
 
 namespace halvox::client {
 
-// A piece of memory to write into. Its address and its size are multiples of 8.
+// A piece of memory into which a frame is written. Its address and its size are multiples of 8.
 struct Segment {
   char* begin = nullptr;
   char* end = nullptr;

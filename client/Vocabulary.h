@@ -17,8 +17,8 @@ struct NamedNumber {
   std::uint32_t number = 0;
 };
 
-// What a message is about. The low 16 bits of a Category are one of these; its high 16 bits may
-// hold one domain.
+// What a message is about. The low 16 bits of a Category are one of these numbers. Its high 16 bits
+// may have one domain.
 enum class CategoryProper : std::uint16_t {
   kGeneric = 1,
   kRecord = 2,

@@ -10,9 +10,9 @@ struct sd_bus_message;
 // unwraps variants.
 namespace halvox::client {
 
-// Reads the next complete value of the message, of any type. Returns std::nullopt at the end of the
-// message, and for types that values cannot hold: file descriptors, other structs, keys that are
-// not strings.
+// Reads the next complete value of the message. Returns std::nullopt at the end of the message, and
+// for types that a Value cannot have: file descriptors, structs other than dates, and dictionaries
+// with keys that are not strings.
 [[nodiscard]] std::optional<Value> readValue(sd_bus_message* message);
 
 }  // namespace halvox::client

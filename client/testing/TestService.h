@@ -42,7 +42,8 @@ class TestService {
   // Ends every connection and removes the socket; come() listens again.
   void vanish();
   void come();
-  // Answers all later requests of that member with an error. An empty name ends this.
+  // Answers all later requests of that member with an error. An empty error name makes it answer
+  // them normally again.
   void refuse(std::string member, std::string errorName = "com.tarno.audio.reporting.Code1");
 
   [[nodiscard]] std::vector<RecordedCall> calls();

@@ -74,7 +74,8 @@ std::string busAddressOf(BusKind bus) {
         return address;
       }
       const std::string runtime = environment("XDG_RUNTIME_DIR");
-      // systemd's user manager puts the bus of a login here even if the variable is not set.
+      // If the variable is not set, the bus is where systemd's user manager puts the bus of a
+      // login.
       return runtime.empty() ? "" : "unix:path=" + runtime + "/bus";
     }
     case BusKind::kSystem: {

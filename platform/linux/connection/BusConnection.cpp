@@ -142,7 +142,8 @@ void BusConnection::handleSignal(const dbus::Frame& frame) {
   std::vector<Value> names;  // the name, its old owner, its new one
   if (dbus::decodeBody(frame, "sss", names).has_value() || !names[2].string().empty()) return;
   const auto found = senders_.find(names[0].string());
-  // Copy the pointer to keep the sender alive: when a sender ends, it may be removed from the map.
+  // Copy the pointer to keep the sender alive, because a sender that ends may be removed from the
+  // map.
   if (found != senders_.end()) std::shared_ptr(found->second)->onVanished();
 }
 
@@ -167,7 +168,7 @@ std::shared_ptr<BusSender> BusConnection::senderNamed(std::string_view name) {
                                 .member = "GetConnectionCredentials"};
   const std::uint32_t serial = stream_.nextSerial();
   if (dbus::appendMethodCall(stream_.output().bytes(), serial, target, "s", arguments)) {
-    // A weak pointer: the sender may leave before the bus answers.
+    // Store a weak pointer, because the sender may leave before the bus answers.
     questions_.emplace(serial, sender);
     stream_.outputAdded();
   }

@@ -18,12 +18,14 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// A local bus answers within milliseconds. A broken bus must not hang the start of the service.
+// How long a bus may take to answer. A local bus answers within milliseconds, and a broken bus must
+// not hang the start of the service.
 constexpr std::chrono::seconds kBusTimeout{5};
 constexpr std::uint32_t kDoNotQueue = 4;    // flag of RequestName: fail if the name is taken
 constexpr std::uint32_t kPrimaryOwner = 1;  // answers of RequestName
 constexpr std::uint32_t kAlreadyOwner = 4;
-// Matches the signal for every name that loses its owner: `arg2` is the new owner, empty for none.
+// Matches the signal that a name has lost its owner. `arg2` is the new owner, which is empty if
+// there is none.
 constexpr std::string_view kVanishingNames =
     "type='signal',sender='org.freedesktop.DBus',interface='org.freedesktop.DBus',"
     "member='NameOwnerChanged',path='/org/freedesktop/DBus',arg2=''";

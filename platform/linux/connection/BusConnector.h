@@ -19,7 +19,7 @@
 
 namespace halvox::platform::linux_ {
 
-// A connection to a bus on which the service owns its name.
+// A connection to a bus, on which the service owns its well-known name.
 struct BusSession {
   UniqueFd fd;                    // non-blocking
   std::vector<std::byte> unused;  // other messages that arrived, to be handled next

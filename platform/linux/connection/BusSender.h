@@ -33,9 +33,9 @@ class BusSender final : public ClientConnection, private DeadlineOwner {
 
   // A whole request.
   void receive(const dbus::MessageHeader& header, std::span<const std::byte> frame);
-  // The header of a request that is larger than the limit.
+  // Takes the header of a request that is larger than the limit, and refuses the request.
   void receiveOversized(const FrameBuffer::Next& next);
-  // Delivers what has been received, unless flow control holds the sender back.
+  // Delivers the requests that have been received, unless flow control holds the sender back.
   void deliverReceived();
   // Called when the bus has sent the sender's credentials or has not answered in time.
   void onCredentials(const PeerCredentials& credentials);

@@ -19,8 +19,8 @@ namespace halvox::platform::linux_ {
 
 class ConnectionHost;
 
-// One client: delivers the requests in its input buffer as fast as the bounds allow, and sends the
-// replies. Subclasses provide the bytes.
+// The connection of one client. Delivers the requests in its input buffer as fast as the bounds
+// allow, and sends the replies. Subclasses provide the bytes.
 //
 //   not resumed ──resume()──► reading ◄──► due: had more than its share, continues in the next turn
 //                               │  ▲
@@ -32,8 +32,8 @@ class ConnectionHost;
 //
 // Belongs to the I/O thread. Shared by the host, the lists of the turn and the delegate.
 // A client that breaks the rules of the wire is disconnected, with an error in the log. A request
-// that is valid on the wire but wrong is answered with an error, and the first of each kind is
-// logged: a client in a loop must not fill the log.
+// that is valid on the wire but wrong is answered with an error. Only the first of each kind is
+// logged, because a client in a loop must not fill the log.
 class ClientConnection : public NSXPCConnection,
                          public std::enable_shared_from_this<ClientConnection> {
  public:
@@ -67,7 +67,7 @@ class ClientConnection : public NSXPCConnection,
   // and when the service ends.
   void abandon();
 
-  // For the code that answers requests.
+  // These functions are for the code that answers requests.
   [[nodiscard]] std::uint64_t number() const { return number_; }
   [[nodiscard]] const PeerCredentials& credentials() const { return credentials_; }
   [[nodiscard]] const NSXPCInterface* exportedInterface() const { return interface_; }
@@ -86,7 +86,7 @@ class ClientConnection : public NSXPCConnection,
   // Returns true for a client on our own socket. Such a client has no bus, and the service answers
   // the calls that it sends to the bus.
   [[nodiscard]] virtual bool isPeerToPeer() const = 0;
-  // Returns true only at the first call: a client must send Hello to the bus exactly once.
+  // Returns true only at the first call, because a client must send Hello exactly once.
   [[nodiscard]] bool takeHello();
 
  protected:

@@ -80,7 +80,7 @@ class OpenRequest {
 // The right to answer one request once. All copies of the request's ReplyCallback share one ticket.
 class ReplyTicket {
  public:
-  // `signature` is the signature of the reply, and must be a constant: it is not copied.
+  // `signature` is the signature of the reply. It must be a constant, because it is not copied.
   ReplyTicket(std::shared_ptr<ClientLink> client, std::uint32_t serial, std::string_view signature)
       : client_(std::move(client)), serial_(serial), signature_(signature) {}
 

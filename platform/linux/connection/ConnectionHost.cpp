@@ -92,8 +92,8 @@ Result<void, ConnectionOpenError> ConnectionHost::openLoop() {
 }
 
 Result<void, ConnectionOpenError> ConnectionHost::openSockets() {
-  // A passed socket and its file belong to systemd. The service then makes no socket of its own,
-  // and removes no file at the end.
+  // A passed socket and its file belong to systemd. If there is one, the service makes no socket of
+  // its own and removes no file at the end.
   auto sockets = passedSockets();
   if (!sockets) return std::move(sockets).error();
   if (sockets->empty()) {
@@ -216,8 +216,8 @@ void ConnectionHost::readMail() {
 void ConnectionHost::acceptPeer(UniqueFd fd, const PeerCredentials& credentials) {
   auto peer =
       std::make_shared<PeerConnection>(*this, nextClientNumber(), std::move(fd), credentials);
-  // Add the peer before asking the delegate: a peer that the delegate refuses removes itself from
-  // the map.
+  // Add the peer before asking the delegate, because a peer that the delegate refuses removes
+  // itself from the map.
   peers_.emplace(peer.get(), peer);
   peer->start();
   static_cast<void>(admit(peer));

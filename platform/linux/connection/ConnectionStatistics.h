@@ -9,7 +9,7 @@
 
 namespace halvox::platform::linux_ {
 
-// Why the adapter answered a request with an error itself.
+// Why the adapter itself refused a request and did not deliver it.
 enum class Refusal : std::uint8_t {
   kUnknownObject,
   kUnknownInterface,
@@ -23,10 +23,10 @@ enum class Refusal : std::uint8_t {
   kTooManyWaiting,
   kNotAllowed,
 };
-// The number of enumerators. Change the name here if another enumerator becomes the last one.
+// The number of enumerators. If you add an enumerator at the end, name it here.
 inline constexpr std::size_t kRefusalKinds = static_cast<std::size_t>(Refusal::kNotAllowed) + 1;
 
-// The name of the refusal in the statistics.
+// Returns the name of the refusal in the statistics.
 std::string_view nameOf(Refusal refusal);
 
 // The adapter's counters. They are looked up only once, and counting then costs one relaxed

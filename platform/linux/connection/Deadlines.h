@@ -11,7 +11,7 @@ namespace halvox::platform::linux_ {
 
 class DeadlineQueue;
 
-// The owner of a Deadline, which is called when the deadline has passed.
+// The owner of a Deadline. It is called when the deadline has passed.
 class DeadlineOwner {
  public:
   virtual ~DeadlineOwner() = default;
@@ -74,7 +74,7 @@ class LoopTimer final : public EventSource {
  public:
   enum class Before : std::uint8_t { kSleep, kNextTurn };
 
-  // Returns false if the system gave no timer.
+  // Returns false if the system cannot make a timer or watch it.
   [[nodiscard]] bool open(EventLoop& loop);
   // Makes the loop wake up at `due`. If the timer is set to an earlier time, leaves it as it is: it
   // expires early and is then set again. This saves a system call for most requests. If `due` is

@@ -31,7 +31,8 @@ class EventLoop {
   // Returns false if the system has no descriptor left.
   [[nodiscard]] bool isOpen() const { return static_cast<bool>(epoll_); }
 
-  // `events` are those of epoll(7). Returns false if the system refuses one more.
+  // `events` are those of epoll(7). Returns false if the system refuses to watch another
+  // descriptor.
   [[nodiscard]] bool watch(int fd, std::uint32_t events, EventSource& source);
   void change(int fd, std::uint32_t events, EventSource& source);
   void forget(int fd);

@@ -65,7 +65,7 @@ void FrameBuffer::settle() {
     view_ = own_;
   }
   if (!view_.empty()) return;
-  // clear() would keep the memory, and most connections are idle most of the time.
+  // Free the memory, because most connections are idle most of the time. clear() would keep it.
   own_ = std::vector<std::byte>();
   view_ = {};
 }
@@ -132,8 +132,9 @@ std::vector<std::byte> FrameBuffer::withoutBody(const Next& oversized) {
   return frame;
 }
 
-// Returns 0 if the next read may go to the scratch. Otherwise returns the most bytes to read into
-// own_: the missing bytes of a large frame, or one read if the unused bytes do not fit the scratch.
+// Returns 0 if the next read may go to the scratch. Otherwise returns how many bytes may be read
+// into own_: the missing bytes of a large frame, or the size of one read if the unused bytes do not
+// fit into the scratch.
 std::size_t FrameBuffer::bytesThatDoNotFitScratch() const {
   if (view_.size() >= dbus::kFrameStartBytes) {
     const dbus::FrameMeasure measure = dbus::measureFrame(view_, dbus::kMaxMessageBytes);

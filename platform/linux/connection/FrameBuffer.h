@@ -65,7 +65,7 @@ class FrameBuffer {
   // settle().
   void append(std::span<const std::byte> bytes);
 
-  // All unused bytes, whether or not they are a frame.
+  // Returns all unused bytes, whether or not they are a whole frame.
   [[nodiscard]] std::span<const std::byte> unused() const { return view_; }
   // Returns the next frame or part of a frame. The result points into this buffer and is valid
   // until the buffer is changed.

@@ -103,7 +103,7 @@ TEST(LifecycleTest, FailedHandshakeIsClosedWithALine) {
 
 class StallTest : public testing::TestWithParam<int> {
  protected:
-  // What each client sends before it stalls.
+  // The bytes that each client sends before it stalls.
   static std::string begin(RawClient& client, int kind) {
     const std::string call = client.callWithText("echo", "some text");
     const std::string handshake = std::string(1, '\0') + "AUTH EXTERNAL\r\nDATA\r\nBEGIN\r\n";

@@ -22,7 +22,8 @@ namespace halvox::platform::linux_ {
 class ConnectionHost;
 class ListeningSocket;
 
-// Whether SIGTERM and SIGINT end the listener's resume(), and SIGUSR1 asks for a report.
+// Whether the loop handles signals: SIGTERM and SIGINT end the listener's resume(), and SIGUSR1
+// asks for a report.
 enum class EndSignals : std::uint8_t { kHandle, kLeaveAlone };
 
 // Which users may connect to the socket's file.
@@ -108,7 +109,7 @@ class LinuxConnectionService final : public ConnectionService {
 
   NSXPCListener& serviceListener() override;
 
-  // Makes resume() return at the end of its turn. Any thread may call it.
+  // Makes resume() return at the end of the current turn of the loop. Any thread may call it.
   void requestStop();
 
  private:

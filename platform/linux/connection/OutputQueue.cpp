@@ -95,7 +95,7 @@ void OutputQueue::noteSent(std::size_t count) {
   buffer.bytes.erase(0, cut);
   buffer.frameEnds.erase(buffer.frameEnds.begin(),
                          buffer.frameEnds.begin() + static_cast<std::ptrdiff_t>(buffer.sentFrames));
-  // The ends are offsets from the start of the buffer, which is `cut` bytes later now.
+  // The ends are offsets from the start of the buffer, from which `cut` bytes were removed.
   for (std::size_t& end : buffer.frameEnds) end -= cut;
   buffer.sentBytes = 0;
   buffer.sentFrames = 0;

@@ -105,7 +105,7 @@ void RequestDispatcher::dispatch(ClientConnection& client, const dbus::Frame& fr
 }
 
 void RequestDispatcher::deliver(const Request& request, const InterfaceMethod& method) {
-  // Check rights and limits before the body: a refused request then needs no decoding.
+  // Check rights and limits before decoding the body. A refused request then needs no decoding.
   if (method.access == MethodAccess::kOwner && isForbidden(request, method)) return;
   if (method.effect != MethodEffect::kHoldsNoMore && isOverLimits(request, method)) return;
   scratch_.addedEntries = method.addedEntries;

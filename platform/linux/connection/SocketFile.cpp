@@ -50,7 +50,7 @@ Result<void, Kind> clearTheWay(const std::filesystem::path& path, const sockaddr
   if (!probe) return failure(Kind::kSystem, path, errnoText(errno));
   const int result =
       connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address);
-  // EAGAIN: the backlog is full, which means that a process listens.
+  // EAGAIN means that the backlog is full. A process listens in that case, too.
   if (result == 0 || errno == EAGAIN || errno == EINPROGRESS) {
     return failure(Kind::kAlreadyServed, path,
                    "another process answers on it; stop it or set listener.socket");
@@ -59,7 +59,7 @@ Result<void, Kind> clearTheWay(const std::filesystem::path& path, const sockaddr
     return failure(Kind::kSystem, path,
                    "cannot find out whether another process serves it: " + errnoText(errno));
   }
-  // No process listens: the service that made the file was killed before it could remove it.
+  // No process listens. The service that made the file was killed before it could remove the file.
   static_cast<void>(unlink(path.c_str()));
   return {};
 }
@@ -115,7 +115,7 @@ Result<void, Kind> giveToGroup(const std::filesystem::path& path, const std::str
         .message = "listener.group: expected a group of this system, found " + quoted};
   }
   constexpr uid_t kSameUser = static_cast<uid_t>(-1);
-  // Use the path and not the descriptor: fchown() of a socket does not change its file.
+  // Use the path and not the descriptor, because fchown() of a socket does not change its file.
   if (fchownat(AT_FDCWD, path.c_str(), kSameUser, **id, AT_SYMLINK_NOFOLLOW) == 0) {
     return {};
   }
@@ -132,7 +132,7 @@ bool closeToOthers(int fd, const SocketAccess& access) {
   return fchmod(fd, access.mode & kOwner) == 0;
 }
 
-// Set the group before the mode: the members of the old group must never get access.
+// Set the group before the mode, because the members of the old group must never get access.
 Result<void, Kind> letIn(const std::filesystem::path& path, const SocketAccess& access) {
   if (!access.group.empty()) {
     if (auto given = giveToGroup(path, access.group); !given) return given;

@@ -30,7 +30,7 @@ class SocketFile {
   ino_t inode_ = 0;
 };
 
-// A socket that listens on a file.
+// A socket that listens, and its file.
 struct BoundSocket {
   UniqueFd fd;
   SocketFile file;

@@ -24,7 +24,8 @@ constexpr const char* kBusPath = "/org/freedesktop/DBus";
 constexpr const char* kProperties = "org.freedesktop.DBus.Properties";
 constexpr const char* kServiceName = "com.tarno.halvox.reporting";
 
-// Returns what a command prints on both outputs. Only for the test's own commands.
+// Returns what a command prints on its standard output and standard error. Only for the test's own
+// commands.
 std::string outputOf(const std::string& command) {
   const UniqueHandle<std::FILE*, pclose> pipe(popen((command + " 2>&1").c_str(), "r"));
   std::string output;

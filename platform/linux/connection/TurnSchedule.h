@@ -18,7 +18,7 @@ class SocketStream;
 // thread. Owned by the host.
 class TurnSchedule {
  public:
-  // The functions of the same names in ConnectionOptions.
+  // The arguments are the functions of the same names in ConnectionOptions.
   TurnSchedule(std::function<void()> beginBatch, std::function<void()> endBatch,
                std::function<void()> afterReplies);
 

@@ -232,7 +232,7 @@ TEST_F(AsioDispatchServiceTest, QueuesMayOutliveTheService) {
 
 class AsioDispatchWaitTest : public AsioDispatchServiceTest {
  protected:
-  // Makes that many queues wait on the semaphore, and returns when all of them wait.
+  // Makes that number of queues wait on the semaphore, and returns when all of them wait.
   void letQueuesWait(AsioDispatchService& service, int queues,
                      std::optional<std::chrono::nanoseconds> timeout) {
     const auto semaphore = semaphore_;

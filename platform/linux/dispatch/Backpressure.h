@@ -13,8 +13,8 @@ namespace halvox::platform::linux_ {
 //   low --raise()--> high --relieve(): calls the handler--> low
 class Backpressure {
  public:
-  // Call before the first thread starts. The handler runs on the consumer's thread and must not
-  // block.
+  // Sets the function that relieve() calls. Call it before the first thread starts. The handler
+  // runs on the consumer's thread and must not block.
   void setReliefHandler(std::function<void()> handler) { onRelief_ = std::move(handler); }
 
   // Relaxed, because a connection that sees the bit late only reads a few more requests.

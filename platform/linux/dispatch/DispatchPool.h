@@ -70,8 +70,8 @@ class DispatchPool {
 
   const std::shared_ptr<JobRunner> runner_;
   QueueLabels labels_;
-  // Sequentially consistent with each other: either waitUntilIdle() sees that the last turn has
-  // ended, or endTurn() sees that a thread waits.
+  // These two are sequentially consistent with each other: either waitUntilIdle() sees that the
+  // last turn has ended, or endTurn() sees that a thread waits.
   std::atomic<std::int64_t> turns_{0};
   std::atomic<bool> isAwaited_{false};
   Mutex mutex_;

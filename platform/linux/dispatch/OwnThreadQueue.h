@@ -58,10 +58,10 @@ class OwnThreadQueue final : public DispatchQueue,
   // Lets the thread end after the job that is running. Discards the waiting jobs and those that are
   // added later.
   void stop();
-  // Returns true if the thread has finished its work. Joining it then takes no time.
+  // Returns true if the thread has finished its last work. Joining it then takes no time.
   [[nodiscard]] bool hasEnded() const;
-  // Waits for the end of the thread, at most until `deadline`. Returns false if it has not ended by
-  // then.
+  // Waits for the end of the thread, at most until `deadline`. Returns false if the thread has not
+  // ended by then.
   bool waitForEnd(std::chrono::steady_clock::time_point deadline);
 
   // Runs the brief jobs at the front of the queue on the calling thread, at most `limit` of them.

@@ -95,8 +95,8 @@ int UnfinishedFile::finish(const std::string& name) {
 }
 
 int UnfinishedFile::giveName(const std::string& name) {
-  // linkat() cannot replace a file, renameat() can. If the name is taken, link the file under a
-  // temporary name and rename that.
+  // linkat() cannot replace a file, but renameat() can. If the name is taken, link the file under a
+  // temporary name and rename it.
   if (ownName_.empty()) {
     const std::string link = "/proc/self/fd/" + std::to_string(file_.get());
     const auto giveTo = [&](const std::string& to) {

@@ -25,7 +25,8 @@ EventName* EventNames::find(std::string_view name) {
     EventName* present = slots_[index].load(std::memory_order_acquire);
     if (present == nullptr) {
       if (made == nullptr) {
-        // Threads that test the bound at the same time may exceed it by at most their number.
+        // If several threads test the bound at the same time, they may exceed it by at most their
+        // number.
         if (count_.load(std::memory_order_relaxed) >= kMostNames) return nullptr;
         made = std::make_unique<EventName>(name, matches(name));
       }
@@ -36,7 +37,7 @@ EventName* EventNames::find(std::string_view name) {
       // Another thread has set the slot first. Its entry is now in `present`, and may be the entry
       // of this name.
     }
-    // Try the next slot, until the name or an empty slot is found. An empty slot proves that the
+    // Try the next slot, until the slot has the name or is empty. An empty slot proves that the
     // name is not in the table, because entries are never removed.
     if (present->text == name) return present;
     index = (index + 1) % kSlots;

@@ -21,10 +21,12 @@ namespace halvox::platform::linux_ {
 namespace {
 
 constexpr std::size_t kKeptBufferBytes = 256 * 1024;
-// The shortest form of a double has at most 24 characters, an integer of 64 bits at most 20.
+// No number is longer: the shortest form of a double has at most 24 characters, and an integer of
+// 64 bits at most 20.
 constexpr std::size_t kLongestNumber = 32;
 
-// RFC 3339 has four digits for the year. Both bounds are in seconds since 1970.
+// The range of dates that are written as RFC 3339, which has four digits for the year. Both bounds
+// are in seconds since 1970.
 constexpr double kEarliest = -62135596800.0;  // 0001-01-01
 constexpr double kEnd = 253402300800.0;       // 10000-01-01
 
@@ -67,8 +69,8 @@ TextKind classify(std::string_view text) {
 // Writes a date as "2023-11-14T22:13:20.250000Z" into `buffer`.
 std::string_view dateText(double secondsSince1970, std::span<char, 64> buffer) {
   using namespace std::chrono;
-  // Limit the result: a date just before the end would be rounded up to the year 10000.
-  // Round, because a fraction such as .1 is often a little less as a double.
+  // Limit the result, because a date just before the end would be rounded up to the year 10000.
+  // Round, because as a double a fraction such as .1 is often a little less.
   const auto rounded = microseconds{std::llround(secondsSince1970 * 1e6)};
   const sys_time<microseconds> time{
       std::min(rounded, duration_cast<microseconds>(duration<double>(kEnd)) - microseconds(1))};

@@ -1,5 +1,5 @@
-// The contracts of analytics, metrics and the power log, run on the services that record in the
-// store.
+// Runs the contract suites of analytics, metrics and the power log on the services that record in
+// the store.
 
 #include <memory>
 #include <stdexcept>

@@ -64,7 +64,7 @@ class RecordKind {
   [[nodiscard]] virtual bool hasTaken() const = 0;
 
   // Writes taken records into the open transaction, in order, until none remains or the allowance
-  // is used up. Subtracts from the allowance what it wrote.
+  // is used up. Subtracts the written records and their bytes from the allowance.
   [[nodiscard]] virtual SqliteCode write(TransactionAllowance& allowance) = 0;
   // Called after a successful commit. Counts the records as stored and adds them to `finished`.
   virtual void onCommitted(FinishedRecords& finished) = 0;

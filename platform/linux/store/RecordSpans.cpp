@@ -67,8 +67,8 @@ SqliteCode RecordSpans::readNext(Database& database) {
   if (code != SQLITE_ROW) return code;
   const std::int64_t newest = statement.integer(0);
   const std::int64_t span = statement.integer(1);
-  // If all records of the newest span were deleted, it is unknown how many of its numbers were
-  // used. Continue with the next span.
+  // If all records of the newest span were deleted, it is not known which of its numbers were used.
+  // Continue with the first number of the next span.
   const bool isUsedUp = span > newest / kRecordsPerSpan || (newest == 0 && span == 0);
   next_ = nextCommitted_ = isUsedUp ? (span + 1) * kRecordsPerSpan : newest + 1;
   span_ = {};

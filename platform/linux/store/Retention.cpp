@@ -66,8 +66,8 @@ SqliteCode Retention::prepare(Database& database) {
   // Read the size of a page from SQLite, because a database that another program made may have
   // another page size than ours.
   pageBytes_ = static_cast<std::uint64_t>(database.queryInteger("PRAGMA page_size").value_or(0));
-  // Vacuum writes each page that it moves to the write-ahead log. Move so few pages at a time that
-  // the log does not outgrow its limit.
+  // Vacuum moves pages, and each moved page is written to the write-ahead log. Move so few pages at
+  // a time that the log does not outgrow its limit.
   const std::uint64_t vacuumPages =
       limits_.transactionBytes / (2 * std::max(pageBytes_, kLeastPage));
   const std::string vacuum = "PRAGMA incremental_vacuum(" + std::to_string(vacuumPages) + ")";

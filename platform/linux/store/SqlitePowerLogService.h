@@ -14,7 +14,7 @@ class SqlitePowerLogService final : public PowerLogService {
   SqlitePowerLogService(SqliteStore& store, const ClockService& clock)
       : records_(store.powerEvents()), clock_(clock) {}
 
-  // Stores `payload` and `extra` as one dictionary. If both have a key, the value of `extra` is
+  // Stores `payload` and `extra` as one dictionary. If a key is in both, the value in `extra` is
   // lost.
   void logPowerEvent(std::uint32_t categoryID, std::string_view eventName,
                      const Dictionary& payload, const std::optional<Dictionary>& extra) override;

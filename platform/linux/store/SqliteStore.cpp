@@ -119,9 +119,10 @@ bool SqliteStore::makeReady() {
   return opened.has_value();
 }
 
-// SQLite can reuse its write-ahead log from the beginning only when no reader needs an older state
-// of the database. A reader that never finishes makes the log grow without end. When the log is as
-// large as the database may be, records are dropped instead of filling the disk.
+// Returns false after dropping the taken records because the write-ahead log is full. SQLite can
+// reuse its log from the beginning only if no reader needs an older state of the database. A reader
+// that never finishes makes the log grow without end. If the log is as large as the database may
+// be, records are dropped, because they would fill the disk.
 bool SqliteStore::logHasRoom() {
   if (files_.logBytes() <= sizes_.databaseBytes) return true;
   const SqliteCode code = sqlite3_wal_checkpoint_v2(database_.get(), nullptr,
@@ -220,7 +221,7 @@ SqliteCode SqliteStore::prepareStatements() {
 SqliteCode SqliteStore::writeTransaction() {
   TransactionAllowance allowance{kRecordsPerTransaction,
                                  static_cast<std::int64_t>(sizes_.transactionBytes)};
-  // fail() reads errno when SQLite itself does not report the system's error.
+  // Set errno to 0, because fail() reads it if SQLite itself does not report the system's error.
   errno = 0;
   SqliteCode code = begin_.run();
   for (RecordKind* const kind : kinds_) {

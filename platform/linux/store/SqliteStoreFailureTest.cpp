@@ -74,7 +74,7 @@ TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileTheDiskIsFullThenStoresA
   EXPECT_THAT(rows(database(), "PRAGMA integrity_check"), ElementsAre("ok"));
 }
 
-// Records of all kinds share transactions, and a full disk fails them together. Each kind must
+// Records of all kinds share transactions, and on a full disk they fail together. Each kind must
 // count its own losses.
 TEST_F(SqliteStoreFailureTest, RecordsOfEveryKindAreCountedWhileTheDiskIsFullAndStoredAgainLater) {
   start();
@@ -127,7 +127,7 @@ TEST_F(SqliteStoreFailureTest, DropsAndCountsEventsWhileAnotherProcessLocksTheFi
   start();
   Database other;
   ASSERT_EQ(other.open(database(), DatabaseAccess::kReadWrite), SQLITE_OK);
-  // The store may hold the lock itself for a moment after its start.
+  // Try repeatedly, because the store may hold the lock itself for a moment after its start.
   ASSERT_TRUE(eventually([&] { return other.execute("BEGIN IMMEDIATE") == SQLITE_OK; }));
   send(1);
   ASSERT_TRUE(allIsStored());

@@ -194,7 +194,7 @@ StoreCheck::Outcome StoreCheck::readTable(Database& database, const std::string&
     if (code != SQLITE_ROW && code != SQLITE_DONE) {
       what = table + ": " + (database.hasError() ? database.errorText() : "a row is damaged");
     }
-    // Ends the transaction before the pause.
+    // End the transaction before the pause.
     rows.reset();
     if (!pause(Clock::now() - begun)) return Outcome::kStopped;
   }

@@ -29,7 +29,7 @@ class StoreCheckTest : public StoreFixture {
     start();
     sendMany();
     ASSERT_TRUE(allIsStored());
-    // Copy the log into the database, so that the log holds only a few records.
+    // Copy the log into the database. The log then has only a few records.
     ASSERT_TRUE(eventually([this] { return isLogCopied(); }));
     send(kEvents);
     ASSERT_TRUE(allIsStored());

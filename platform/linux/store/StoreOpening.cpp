@@ -82,7 +82,7 @@ Result<void, StoreError> examine(const StoreFiles& files, Database& database) {
   return {};
 }
 
-// Opens the file and migrates it. Does not leave the database open after a failure.
+// Opens the file and migrates the database. After a failure the database is not open.
 Result<void, StoreError> attempt(const StoreFiles& files, const StoreSizes& sizes,
                                  Database& database) {
   auto opened = examine(files, database);

@@ -146,7 +146,7 @@ TEST_F(StoreRecordsTest, LockedDatabaseDropsAndCountsAllKinds) {
   {
     Database other;
     ASSERT_EQ(other.open(database(), DatabaseAccess::kReadWrite), SQLITE_OK);
-    // The store may hold the lock itself for a moment after its start.
+    // Try repeatedly, because the store may hold the lock itself for a moment after its start.
     ASSERT_TRUE(eventually([&] { return other.execute("BEGIN IMMEDIATE") == SQLITE_OK; }));
     sendLink(1, 1);
     send(1);

@@ -151,8 +151,8 @@ UNION ALL
 SELECT time, session_id, client_name, service_name, category, type, payload FROM halvox_links;
 )sql";
 
-// Step n migrates from version n to version n + 1. Never change a step that was released: stores
-// that have already applied it would differ from new ones.
+// Step n migrates from version n to version n + 1. Never change a step that was released, because
+// stores that have already applied it would differ from new ones.
 constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords, kMessageBlocks};
 
 }  // namespace

@@ -19,9 +19,10 @@ extern const std::int64_t kStoreSchemaVersion;
 // The first schema version with message_blocks.
 constexpr std::int64_t kBlocksSinceVersion = 3;
 
-// Migrates an empty or older database to the current version, one transaction a step. On an error
-// it rolls the failed step back, keeps the steps before it and returns the code; the next call
-// continues there. The database must not be newer than kStoreSchemaVersion.
+// Migrates an empty or older database to the current version, with one transaction for each step.
+// After an error, rolls the failed step back, keeps the steps before it and returns the code. The
+// next call continues with the failed step. The database must not be newer than
+// kStoreSchemaVersion.
 [[nodiscard]] SqliteCode migrate(Database& database);
 
 }  // namespace halvox::platform::linux_

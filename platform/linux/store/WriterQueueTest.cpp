@@ -116,7 +116,8 @@ TEST(WriterQueueTest, HoldsFewerRecordsWhenWritingIsSlow) {
   now += kSmall.softTime;  // the slow writing
   queue.finish(4, 0);
 
-  // Four waiting records are too many, because four records took longer than the soft time.
+  // Four waiting records reach the soft limit, because the last four took longer to write than the
+  // soft time.
   addMany(queue, 4);
   EXPECT_TRUE(backpressure.isHigh());
 }

@@ -11,7 +11,7 @@
 
 namespace halvox::platform::linux_ {
 
-// The answer of a method: its texts and numbers as text, or the name and text of an error.
+// The answer of a method: its first value as text, or the name and text of an error.
 struct BusAnswer {
   std::string text;
   std::string errorName;

@@ -19,7 +19,7 @@ namespace halvox::platform::linux_ {
 // The service with the test's object, serving on a thread of its own in a scratch directory.
 class ServiceUnderTest {
  public:
-  // Called with the options before the service is made.
+  // Called before the service is made, to change its options.
   explicit ServiceUnderTest(const std::function<void(ConnectionOptions&)>& configure = {});
   ServiceUnderTest(const ServiceUnderTest&) = delete;
   ServiceUnderTest& operator=(const ServiceUnderTest&) = delete;

@@ -18,7 +18,7 @@ const ReplyTo kPeer{7, {}};
 const CallTarget kTarget{"org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus",
                          "AddMatch"};
 
-// A written frame that was read back, with the bytes that it points into.
+// The bytes of a written frame, and the frame that was read from them.
 struct Written {
   std::string bytes;
   Frame frame;

@@ -196,7 +196,7 @@ TEST(GoldenFramesTest, FrameCutAnywhereIsAnError) {
   for (const GoldenFrame& frame : kGoldenFrames) {
     const std::string bytes = fromHex(frame.hex);
     for (std::size_t length = 0; length < bytes.size(); ++length) {
-      // Make a copy of exactly these bytes: AddressSanitizer then detects reads past their end.
+      // Make a copy of exactly these bytes. AddressSanitizer then detects reads past their end.
       const std::vector<char> cut(bytes.begin(),
                                   bytes.begin() + static_cast<std::ptrdiff_t>(length));
       const auto result = readFrame(std::as_bytes(std::span(cut)));

@@ -206,7 +206,8 @@ void ClientHandshake::start(std::string& output) const {
 HandshakeProgress ClientHandshake::feed(std::span<const std::byte> input, std::string& output) {
   std::span<const std::byte> rest = input;
   if (state_ == HandshakeState::kContinue) {
-    // Take only one line: a server answers with one line, and what follows belongs to the messages.
+    // Take only one line. A server answers with one line, and the bytes after it belong to the
+    // messages.
     if (line_.take(rest)) {
       onLine(line_.text(), output);
     } else if (line_.isTooLong()) {

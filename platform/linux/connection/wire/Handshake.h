@@ -101,8 +101,8 @@ class ClientHandshake {
 
   // Appends the first line of the client. Call it once, before feed().
   void start(std::string& output) const;
-  // Takes the server's answers. The handshake is done when the server has agreed; `output` then
-  // ends with BEGIN, after which messages may follow.
+  // Takes the server's answers. The handshake is done when the server has agreed. `output` then
+  // ends with the line BEGIN, and messages may follow it.
   HandshakeProgress feed(std::span<const std::byte> input, std::string& output);
   // The identity of the server; empty before the handshake is done.
   [[nodiscard]] std::string_view serverGuid() const { return guid_; }

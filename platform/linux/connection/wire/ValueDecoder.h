@@ -27,7 +27,7 @@ struct DecodeError {
   // keys and element numbers (from 0) inside the argument, as in `argument 1, key "a"."b"[3]`. Long
   // keys are cut. Empty for kWrongSignature.
   std::string key;
-  // The signature of the value; empty if it is not known. Cut if it is malformed and long.
+  // The signature of the value; empty if it is not known. Long malformed signatures are cut.
   std::string signature;
   // One line of valid UTF-8 with the place and the signature, for the log and for the answer to the
   // client.

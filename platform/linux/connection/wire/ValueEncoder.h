@@ -38,7 +38,7 @@ class ValueEncoder {
   // These two functions do not check the characters of the text.
   void appendText(std::string_view text);
   void appendSignature(std::string_view signature);
-  // Overwrites a length that was appended as 0.
+  // Replaces a length that was appended as 0.
   void replaceLength(std::size_t position, std::size_t length);
 
  private:

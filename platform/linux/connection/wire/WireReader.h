@@ -36,7 +36,7 @@ class WireReader {
   [[nodiscard]] std::string_view rest() const { return {bytes_ + position_, limit_ - position_}; }
   void skip(std::size_t bytes) { position_ += bytes; }
 
-  // Notes the problem, and returns false.
+  // Stores the problem, and returns false.
   bool fail(std::string_view problem) {
     problem_ = problem;
     return false;

@@ -7,9 +7,9 @@
 
 namespace halvox::platform::linux_ {
 
-// Loads halvox-link-nats.so, which brings the client library of NATS and, with it, OpenSSL. Returns
-// the back-end, or why the module cannot be loaded. Does not connect until a session looks for
-// back-ends.
+// Loads halvox-link-nats.so, and with it the client library of NATS and OpenSSL. Returns the
+// back-end, or why the module cannot be loaded. The back-end does not connect until a session looks
+// for back-ends.
 [[nodiscard]] Result<std::unique_ptr<NatsTlmReporting>> loadNatsTlmReporting(
     const Configuration::Link& options, const NatsEnvironment& environment);
 

@@ -66,7 +66,8 @@ class NatsPublisher {
   // Long enough for a cluster to elect a leader, and for most restarts of a server. At most half of
   // the time for which the stream recognises identifiers; see NatsStream.cpp.
   static constexpr std::chrono::seconds kAckTime{30};
-  // The pause between two probes. Short compared with an election, which takes seconds.
+  // The pause between two probes. It is short compared with the election of a leader, which takes
+  // seconds.
   static constexpr std::chrono::milliseconds kResendPause{100};
   // The pause between two lookups of the stream. A lookup costs a cluster more than a probe.
   static constexpr std::chrono::seconds kStreamCheckPause{2};

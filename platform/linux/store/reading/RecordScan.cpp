@@ -121,7 +121,7 @@ SqliteCode RecordScan::next(std::vector<StoredRecord>& piece) {
 }
 
 bool RecordScan::passes(const Statement& row) const {
-  // The cheap tests come first. The caller's condition comes last, because it needs the whole
+  // Make the cheap tests first. The caller's condition is the last test, because it needs the whole
   // record.
   if (!isWithinTimes(filter_, row.real(kTime))) return false;
   for (const NumberMatch& match : filter_.numbers) {

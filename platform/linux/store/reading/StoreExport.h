@@ -27,7 +27,7 @@ class StoreExport {
   // Copies the records of all kinds that pass the filter. A service may write to the store at the
   // same time. The error says why the store cannot be read or the file cannot be written.
   Result<void> copyFrom(StoreReader& reader, const RecordFilter& filter);
-  // Gives the file its name. Replaces an existing file of that name.
+  // Commits, and gives the file its final name. Replaces an existing file of that name.
   Result<void> finish();
 
   [[nodiscard]] std::uint64_t records() const { return records_; }

@@ -36,8 +36,8 @@ struct StoredEvent {
   std::string_view payload;  // JSON text
 };
 
-// A stored record of any other kind. `fields` has the values of RecordTable::columns, in order;
-// bytes are in a std::string.
+// A stored record of any other kind. `fields` has the values of RecordTable::columns, in their
+// order. A column of bytes is a std::string.
 struct StoredRecord {
   using Field = std::variant<std::int64_t, std::string>;
   StoredRecordID id;
@@ -52,8 +52,8 @@ struct StoredRecord {
   }
 };
 
-// A stored record of any kind, read without a copy. Its views are valid during the callback only. A
-// member that the kind does not have is empty or 0.
+// A stored record of any kind, without a copy of its texts. Its views are valid during the callback
+// only. A member that the kind does not have is empty or 0.
 struct StoredItem {
   const RecordTable* table = nullptr;  // null: an event
   StoredRecordID id = 0;
@@ -79,7 +79,8 @@ struct StoredKinds {
 
 // Which records to read. A member that is not set selects everything.
 struct RecordFilter {
-  // Patterns for fnmatch(3). The name must match at least one; kinds without a name ignore them.
+  // Patterns for fnmatch(3). The name must match at least one of them. Kinds without a name ignore
+  // them.
   std::vector<std::string> names{};
   std::optional<double> since{};          // seconds since 1970, inclusive
   std::optional<double> until{};          // seconds since 1970, exclusive

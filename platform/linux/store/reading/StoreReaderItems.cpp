@@ -13,8 +13,8 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// One ordered sequence of records. begin(), then advance() until isAtEnd(). After an error the
-// cursor is over.
+// One ordered sequence of records. Call begin(), then advance() until isAtEnd(). After an error the
+// cursor must not be used again.
 class ItemCursor {
  public:
   ItemCursor() = default;
@@ -23,7 +23,7 @@ class ItemCursor {
   virtual ~ItemCursor() = default;
 
   [[nodiscard]] virtual SqliteCode begin() = 0;
-  // Moves to the next record; the views of the one before are no longer valid.
+  // Moves to the next record. The views of the previous record are no longer valid then.
   [[nodiscard]] virtual SqliteCode advance() = 0;
   [[nodiscard]] const StoredItem& item() const { return item_; }
   [[nodiscard]] bool isAtEnd() const { return isAtEnd_; }
@@ -103,7 +103,7 @@ class EventCursor final : public ItemCursor {
   std::size_t next_ = 0;
 };
 
-// The records of one kind that are stored one to a row.
+// The records of one kind of which each has a row of its own.
 class RowCursor final : public ItemCursor {
  public:
   RowCursor(Database& database, const RecordTable& table, const RecordFilter& filter)
@@ -161,7 +161,7 @@ using Cursors = std::vector<std::unique_ptr<ItemCursor>>;
 Cursors cursorsFor(Database& database, std::int64_t version, const StoredKinds& kinds,
                    const RecordFilter& filter) {
   Cursors cursors;
-  // A store from an older service lacks the table and has no such records.
+  // If an older service made the store, it may lack the table and has no such records then.
   const auto addRows = [&](bool wanted, const RecordTable& table) {
     if (!wanted || version < table.sinceVersion) return;
     cursors.push_back(std::make_unique<RowCursor>(database, table, filter));
@@ -177,8 +177,8 @@ Cursors cursorsFor(Database& database, std::int64_t version, const StoredKinds& 
   return cursors;
 }
 
-// The cursor whose record is the oldest; nullptr if all are at their end. There are at most six: a
-// heap would cost more than it saves.
+// Returns the cursor with the oldest record; nullptr if all are at their end. A heap would cost
+// more than it saves, because there are at most six cursors.
 ItemCursor* oldestOf(const Cursors& cursors) {
   ItemCursor* oldest = nullptr;
   for (const auto& cursor : cursors) {
@@ -194,7 +194,7 @@ Result<void, StoreError> StoreReader::forEachItem(const StoredKinds& kinds,
                                                   const RecordFilter& filter,
                                                   const ItemCallback& callback) {
   if (!database_.isOpen()) return Failure<StoreError>{StoreError::kMissing, "no store is open"};
-  // Read the version for each call: a service may have migrated the store since it was opened.
+  // Read the version at each call. A service may have migrated the store since it was opened.
   const auto version = database_.queryInteger("PRAGMA user_version");
   if (!version.has_value()) return failure(sqlite3_extended_errcode(database_.get()));
   RecordFilter times;
@@ -202,7 +202,7 @@ Result<void, StoreError> StoreReader::forEachItem(const StoredKinds& kinds,
   times.until = filter.until;
   const Cursors cursors = cursorsFor(database_, *version, kinds, times);
   const auto failed = [&](const ItemCursor& cursor, SqliteCode code) {
-    // SQLite knows nothing of damage inside a block.
+    // SQLite does not notice damage inside a block and has no text for it.
     return code == SQLITE_CORRUPT && sqlite3_errcode(database_.get()) != SQLITE_CORRUPT
                ? damagedBlock(cursor.item().id)
                : failure(code);

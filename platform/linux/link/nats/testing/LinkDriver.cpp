@@ -33,7 +33,7 @@ using namespace halvox::platform;
 using namespace halvox::platform::linux_;
 using Clock = std::chrono::steady_clock;
 
-// An event that another thread announces with a text, and the time until the announcement.
+// An event that another thread announces with a text. Measures the time until the announcement.
 class Announcement {
  public:
   void announce(std::string text) {
