@@ -37,9 +37,9 @@ struct PeerCredentials;
 //   2. delivers for the clients that had more than their share in the last turn
 //   3. calls the handlers of connections that have ended
 //   4. ends the batch: this thread now runs the brief jobs that it has queued (docs/decisions/0002)
-//   5. reads the mail of other threads
+//   5. reads the inbox: what other threads have posted
 //   6. writes: one system call for each connection with output. All replies of the turn leave
-//      together, including those of helped jobs and of mail
+//      together, including those of helped jobs and of other threads
 //   7. wakes the pool for the queues that the jobs used
 //
 // The host belongs to the I/O thread, which is the thread that calls resume(). Any thread may call

@@ -41,8 +41,8 @@ struct ConnectionOptions {
   bool makeSocketDirectory = false;
   BusKind bus = BusKind::kNone;  // open() fails if the service cannot join it
   // The bus that started the service. The service joins this bus, too, unless it is `bus`. A
-  // failure is only logged: every process inherits this value from a process that a bus has
-  // started, and that bus may not be meant for the service.
+  // failure is only logged, because a process inherits this value if a bus has started one of its
+  // ancestors, and that bus may not be meant for the service.
   std::optional<StarterBus> starter;
   std::string busName = "com.tarno.halvox.reporting";
   std::chrono::milliseconds handshakeTimeout{defaults::kHandshakeTimeout};

@@ -18,7 +18,7 @@ int removeNothing(const char* /*name*/) {
   return -1;
 }
 
-// Succeeds for the name that is not there yet, and fails for the one that was created.
+// Succeeds while no file has the name. Fails once the file exists.
 int removeNothingThatExists(const char* name) {
   errno = ::access(name, F_OK) == 0 ? EACCES : ENOENT;
   return -1;

@@ -40,8 +40,8 @@ class IndentedJsonArray::Text {
     isTaken_ = true;
     return text_;
   }
-  // Discards the text that the caller has taken. Called not before new text is appended, because
-  // the caller may read the old text until then.
+  // Discards the text that the caller has taken. Called only just before new text is appended,
+  // because the caller may read the old text until then.
   void begin() {
     if (isTaken_) text_.clear();
     isTaken_ = false;

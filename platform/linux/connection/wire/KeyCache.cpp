@@ -50,7 +50,7 @@ KeyCache::Head KeyCache::find(std::string_view bytes) {
   if (length > bytes.size() - kLengthBytes - kTailBytes) return {};
   const std::string_view text = bytes.substr(kLengthBytes, length);
   Slot& slot = slotOf(text);
-  // Test for a free slot first. Invalid bytes, an empty text and zeros, can be equal to the content
+  // Test for a free slot first. Invalid bytes (an empty text and zeros) can be equal to the content
   // of a free slot.
   if (!slot.key.has_value()) return {};
   if (wordAt<std::uint32_t>(text.data() + length) != slot.tail || text != slot.text) return {};

@@ -90,9 +90,9 @@ class NatsPublisher {
   [[nodiscard]] std::optional<Error> take(OutgoingMessage& message) HALVOX_EXCLUDES(mutex_);
   // Counts a message that was not queued. Its sender gets the error from the caller.
   void refuse(const OutgoingMessage& message);
-  // After this call, the last pending acknowledgement also calls `wake`. Before it, it does not:
-  // with little traffic, every acknowledgement is the last pending one and would wake the thread
-  // for nothing.
+  // After this call, the last pending acknowledgement also calls `wake`. Without this call it does
+  // not, because with little traffic every acknowledgement is the last pending one and would wake
+  // the thread for nothing.
   void beginEnd() HALVOX_EXCLUDES(mutex_);
   // Abandons all queued and all unacknowledged messages.
   void abandonAll() HALVOX_EXCLUDES(mutex_);

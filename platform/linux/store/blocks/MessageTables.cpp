@@ -211,8 +211,9 @@ int advance(sqlite3_vtab_cursor* base) {
   }
 }
 
-// Returns the key of an argument; std::nullopt if its type differs from the column's. Such a value
-// can be equal to a value of the column after conversion, and its key would not find that one.
+// Returns the key of an argument; std::nullopt if its type differs from the column's. SQLite may
+// convert such a value, which then equals a value of the column although the two have different
+// keys.
 std::optional<BlockKey> keyOf(BlockKeyKind kind, sqlite3_value* value) {
   if (kind == BlockKeyKind::kSession) {
     if (sqlite3_value_type(value) != SQLITE_INTEGER) return std::nullopt;
