@@ -31,7 +31,7 @@ SessionCounters::Link linkOf(const Piece& piece) {
   return {.received = piece["received"],
           .sent = piece["sent"],
           .failed = piece["failed"],
-          .single = piece["handed on: single message"],
+          .single = piece["passed on: single message"],
           .redundant = piece["suppressed: redundant"],
           .notAllowed = piece["dropped: transactions not allowed"],
           .testSession = piece["dropped: test session"],

@@ -195,7 +195,7 @@ TEST_F(SessionLinkMessagesTest, ATestSessionThatIsNotStartedSendsASingleMessage)
   EXPECT_EQ(*framework_.singleMessageInfos().at(0).userInfo.find("TLMReportingUserInfoServiceName"),
             platform::Value("test"));
   EXPECT_THAT(platform_.statistics.values("link"),
-              UnorderedElementsAre(Pair("received", 1U), Pair("handed on: single message", 1U)));
+              UnorderedElementsAre(Pair("received", 1U), Pair("passed on: single message", 1U)));
 }
 
 TEST_F(SessionLinkMessagesTest, ASessionThatBecameATestSendsNoMore) {
@@ -291,7 +291,7 @@ TEST_F(SessionLinkMessagesTest, EveryMessageIsAccountedFor) {
   EXPECT_THAT(
       platform_.statistics.values("link"),
       UnorderedElementsAre(Pair("received", 6U), Pair("sent", 1U), Pair("failed", 1U),
-                           Pair("handed on: single message", 1U), Pair("suppressed: redundant", 1U),
+                           Pair("passed on: single message", 1U), Pair("suppressed: redundant", 1U),
                            Pair("dropped: no back-end", 2U)));
 }
 

@@ -20,8 +20,8 @@ namespace {
 using platform::linux_::StoreQueries;
 using Value = StoreQueries::Value;
 
-// The text of the rows of one statement, in a file without a name: a result may be larger than
-// memory.
+// The text of the rows of one statement. It is in a file without a name, because a result may be
+// larger than memory.
 class Spool {
  public:
   Spool() : file_(std::tmpfile(), std::fclose) { isGood_ = file_ != nullptr; }
@@ -135,8 +135,8 @@ class Shell {
         [&](const std::vector<Value>& values) { spool.add(row(names, values)); });
     // The rows before an error are printed too.
     if (!spool.copyTo(streams_.output)) {
-      return complain_(ExitStatus::kCannotWrite,
-                       "a temporary file for the rows: " + platform::linux_::errnoText(errno));
+      return complain_(ExitStatus::kCannotWrite, "cannot keep the rows in a temporary file: " +
+                                                     platform::linux_::errnoText(errno));
     }
     streams_.output << std::flush;
     if (!ran) return complain_(ExitStatus::kBadArguments, ran.error().message);

@@ -94,7 +94,7 @@ bool read(const std::string& file, const SummaryMessageHandler& handler, Session
   return totals.has_value();
 }
 
-// Reads the file twice: the table comes before the messages and needs all of them.
+// Reads the file twice, because the table comes before the messages and needs all of them.
 ExitStatus showOne(const std::string& file, OutputForm form, std::ostream& out,
                    const Complaint& complain) {
   Session session;
@@ -138,7 +138,8 @@ std::vector<std::string> newestIn(const fs::path& directory, std::uint64_t count
     if (name) found.emplace_back(name->secondsSince1970, entry->path().string());
   }
   std::ranges::sort(found);
-  // Sorted by the time in the name, not by the file's: copies have other file times.
+  // Sorted by the time in the name, not by the time of the file, because a copy has another file
+  // time.
   if (found.size() > count) found.erase(found.begin(), found.end() - static_cast<long>(count));
   std::vector<std::string> files;
   files.reserve(found.size());
@@ -157,7 +158,7 @@ ExitStatus showNewest(std::uint64_t count, OutputForm form, std::ostream& out,
   if (error || (files.empty() && count > 0)) {
     return complain(ExitStatus::kNoService,
                     directory.string() + ": " + (error ? error.message() : "has no summaries") +
-                        "; the service leaves them on internal builds only",
+                        "; the service writes them on internal builds only",
                     "no-store");
   }
   return showTable(files, form, out, complain);

@@ -41,11 +41,12 @@ constexpr client::ServiceType kTestService = 11;
 // The range of codes that the service records.
 constexpr std::uint32_t kFirstCode = 0x21040000;
 constexpr std::uint32_t kLastCode = 0x2104408A;
-// The service answers the stop after it has read the trace back.
+// The service answers the stop only after it has read the trace back, which can take minutes.
 constexpr std::chrono::minutes kStopWithin{10};
 // The service ends a tracer that does not answer within ten seconds. Wait longer than that.
 constexpr std::chrono::seconds kRecordsWithin{15};
-// Nothing announces that a recording has begun: poll its directory.
+// The pause between two looks into the directory of recordings. It is polled, because nothing
+// announces that a recording has begun.
 constexpr std::chrono::milliseconds kLookEvery{5};
 
 using platform::Dictionary;
@@ -122,7 +123,7 @@ ParamsFindings checkParams(const std::string& file) {
   const TraceParams params = TraceParamsParser(file).loadTraceParams(lists, listener);
   // The service answers such a session like any other and leaves an empty result.
   if (params.type == TraceType::kSignpost) {
-    found.reasons.emplace_back("its TraceType is OSSignpost, of which nothing is recorded");
+    found.reasons.emplace_back("its TraceType is OSSignpost, which the service does not record");
     return found;
   }
   for (const TraceDataParams& point : params.tracePoints) {
@@ -160,13 +161,13 @@ std::optional<Names> recordings(const fs::path& storage) {
   return names;
 }
 
-// Waits for a recording that was not there before: the service answers the start before the tracer
-// is ready. Returns false if none begins.
+// Waits for a recording that was not there before, because the service answers the start before the
+// tracer is ready. Returns false if none begins.
 bool recordsSoon(const fs::path& storage, const Names& before) {
   const auto deadline = std::chrono::steady_clock::now() + kRecordsWithin;
   while (std::chrono::steady_clock::now() < deadline) {
     const auto now = recordings(storage);
-    // A user who may not see the recordings cannot wait for one: the program runs at once.
+    // A user who may not see the recordings cannot wait for one. The program then runs at once.
     if (!now.has_value() || !std::ranges::includes(before, *now)) return true;
     std::this_thread::sleep_for(kLookEvery);
   }
@@ -267,13 +268,15 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
     isUsable ? complain.warn(text) : static_cast<void>(complain(ExitStatus::kBadArguments, text));
   }
   if (!isUsable) return ExitStatus::kBadArguments;
-  // Taken before the session exists: results that an earlier trace left must not be shown as new.
+  // Taken before the session exists, because results that an earlier trace left must not be shown
+  // as new.
   const auto before = identityOf(results);
   const auto socket = namedSocket(options, complain);
   if (const auto* status = std::get_if<ExitStatus>(&socket)) return *status;
   auto opened = client::HalvoxConnection::open(
       std::get<std::string>(socket),
-      // Longer than --timeout: the answer to the stop waits for the evaluation of the trace.
+      // This is longer than --timeout, because the answer to the stop waits for the evaluation of
+      // the trace.
       std::max<std::chrono::milliseconds>(options.timeout, kStopWithin));
   if (!opened) return complain(ExitStatus::kNoService, opened.failure->message);
   const fs::path& storage = configuration.storage.directory;
@@ -294,8 +297,8 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
   if (!ofProgram.empty()) complain(ExitStatus::kRefused, ofProgram);
   if (identityOf(results) == before) {
     return complain(ExitStatus::kRefused,
-                    "the service left no new results in " + results.string() +
-                        "; it traces when Tracing is on in [features.Acoustat]");
+                    "the service wrote no new results to " + results.string() +
+                        "; it traces only if Tracing is on in [features.Acoustat]");
   }
   const ExitStatus shown = showMeasured(results.string(), params, options.form(), out, complain);
   return ofProgram.empty() ? shown : ExitStatus::kRefused;

@@ -85,7 +85,7 @@ void measure(const LoadOptions& options, const Build& build, std::vector<Measure
   };
   add("answer to the stop", "s", seconds, 5.0);
   add("CPU time of the service until then", "s", cpu.count(), {});
-  add("until the service is at rest again", "s", atRest, {});
+  add("until the service is idle again", "s", atRest, {});
   add("longest wait of another client", "s", *std::ranges::max_element(waits), {});
   add("median wait of another client", "us", median(waits) * 1e6, {});
   add("resident memory before", "MiB", static_cast<double>(before) / 1024, {});

@@ -29,8 +29,9 @@ const std::vector<std::pair<std::string, Scenario>>& scenarios() {
 
 int run(int argc, char** argv) {
   CLI::App app{
-      "Measures the reporting service under load, beside a raw sd-bus echo of the same messages in "
-      "the same run. Compare the numbers of one run, not those of different machines."};
+      "Measures the reporting service under load, and a raw sd-bus echo of the same messages in "
+      "the "
+      "same run. Compare the numbers of one run, not those of different machines."};
   LoadOptions options;
   options.programs.echo = std::filesystem::read_symlink("/proc/self/exe").string();
   options.programs.service =

@@ -67,8 +67,8 @@ class KernelTraceTest(unittest.TestCase):
                 service.run_client("intervals", 10)
             values = wait_for_results(service)["values"]
 
-            # The first and the last code are recorded. The codes beside them are not even read
-            # back.
+            # The first and the last code are recorded. The codes just outside this range are not
+            # even read back.
             self.assertEqual(len(values["Edges"]), THREADS * 10)
             self.assertNotIn("Outside", values)
             # Two each of the shared codes, the own codes and the edges, and two across threads.
@@ -103,7 +103,7 @@ class KernelTraceTest(unittest.TestCase):
                     stdin=subprocess.PIPE, stdout=subprocess.PIPE)
                 try:
                     self.assertEqual(client.stdout.readline(), "ready\n")
-                    # Until it continues, the buffers are not emptied.
+                    # While the daemon's consumer is stopped, it does not empty the buffers.
                     consumers = [pid for pid, name in children_of(daemon)
                                  if name.startswith("lttng-consumer")]
                     self.assertEqual(len(consumers), 1)
@@ -229,7 +229,7 @@ class KernelTraceTest(unittest.TestCase):
                 self.assertNotEqual(service.daemon(), daemon)
                 service.run_client("intervals", 1)
             wait_for("the new results", lambda: "Own0" in service.results()["values"])
-            # The first one has already ended.
+            # The first daemon has already ended.
             self.assertFalse(Path(f"/proc/{daemon}").exists())
 
     def test_million_events_are_read_back_without_loss(self):
@@ -420,7 +420,7 @@ class ToolTest(unittest.TestCase):
             done = self.record(service, "true")
 
             self.assertEqual(done.returncode, 1)
-            self.assertIn("left no new results", done.stderr)
+            self.assertIn("wrote no new results", done.stderr)
 
 
 class PerformanceTraceTest(unittest.TestCase):

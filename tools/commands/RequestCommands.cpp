@@ -114,7 +114,8 @@ void addStart(CommandSet& commands) {
 }
 
 Send makeSend(const Arguments& given) {
-  // --all is not the default without --id: the command cannot know which sessions are meant.
+  // --all is not the default without --id, because the command cannot know which sessions are
+  // meant.
   if (given.isToAll == !given.ids.empty()) {
     throw CLI::ValidationError(
         "--id",
@@ -184,7 +185,7 @@ void addRequestCommands(CommandSet& commands) {
                            .example = "halvoxctl list --json"});
   addBare<Kill>(commands,
                 {.name = "kill",
-                 .summary = "End the service at once, without cleanup; only for root and its user",
+                 .summary = "End the service at once, without cleanup; only root and its user may",
                  .example = "halvoxctl kill"});
 }
 
@@ -195,7 +196,7 @@ void addScriptRequests(CommandSet& commands) {
                                  .example = "wait 7 10"});
   addID(wait, arguments);
   addParsed(wait, "SECONDS", arguments->time, parseSeconds,
-            "How long at most (default: the time-out)");
+            "The longest time to wait (default: that of --timeout)");
   onRequest(commands, wait, arguments, [](const Arguments& given) {
     return WaitForStart{given.id, given.time.value_or(std::chrono::milliseconds::zero())};
   });

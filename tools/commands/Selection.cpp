@@ -24,12 +24,12 @@ void addTimes(CLI::App& app, std::optional<double>& since, std::optional<double>
   addParsed(
       app, "--since", since, parseTimeNow,
       "Only " + std::string(records) +
-          " since then: a time that a command printed, \"2026-11-21 22:44\", RFC 3339 with an "
+          " since TIME: a time that a command printed, \"2026-11-21 22:44\", RFC 3339 with an "
           "offset, today, yesterday, how long ago (90s, 5min, 2h, 3d, 1w, also -5min), or "
           "@SECONDS since 1970")
       ->type_name("TIME");
   addParsed(app, "--until", until, parseTimeNow,
-            "Only " + std::string(records) + " before then; TIME as for --since")
+            "Only " + std::string(records) + " before TIME, in the forms of --since")
       ->type_name("TIME");
 }
 

@@ -39,7 +39,7 @@ void addExtract(CommandSet& commands, CLI::App& snapshots) {
   extract
       .add_option(
           "--to", request->directory,
-          "Where to; created if it is missing (default: a directory named like the archive)")
+          "The directory to unpack into, created if needed (default: named like the archive)")
       ->type_name("DIRECTORY");
   extract.add_flag("--force", request->force, "Replace existing files");
   commands.onRun(
@@ -61,7 +61,7 @@ void addSnapshotCommands(CommandSet& commands) {
                     .reach = CommandReach::kFiles});
   snapshots.require_subcommand(0, 1);
   addSelection(snapshots, list->selection, "snapshots", nullptr);
-  // Without a sub-command it lists.
+  // Without a sub-command, the command lists the snapshots.
   commands.onRun(
       snapshots, [list] { return *list; },
       [](const ShowRecords& asked, const CommonOptions& options, const ToolStreams& streams) {
