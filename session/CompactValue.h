@@ -9,7 +9,8 @@
 #include "platform/value.h"
 
 // How a history writes values: each as its difference from the value that the same key had before.
-// Most values of a message repeat or grow a little, so most differences take one to three bytes.
+// Most values of a message repeat or grow a little. Most differences therefore take one to three
+// bytes.
 //
 // Only this process reads the bytes. It does not trust them, because they may have been on a disk
 // meanwhile. A value is read as it was written, down to the type of its numbers.

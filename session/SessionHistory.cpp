@@ -16,8 +16,8 @@ constexpr std::size_t kMostInMemory = 1024 * 1024;
 // As often as the store tries to write again.
 constexpr std::chrono::milliseconds kRetryTime{250};
 
-// Errors are never suppressed, however often they repeat. The category is compared as a whole, so
-// an error category with a domain is not exempt; this is required.
+// Errors are never suppressed, however often they repeat. The category is compared as a whole. An
+// error category with a domain is therefore not exempt; this is required.
 bool isExemptFromSuppression(AudioEventCategory category, AudioEventType type) {
   return category == AudioEventCategory::kError || type == AudioEventType::kError;
 }

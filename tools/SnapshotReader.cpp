@@ -254,7 +254,7 @@ Result<std::vector<std::string>> unpackSnapshot(const fs::path& snapshot, const 
   const bool isMade = ::mkdir(directory.c_str(), 0700) == 0;
   if (!isMade && errno != EEXIST) return failed(directory, errnoText(errno));
   auto unpacked = unpack(source, directory, existing);
-  // rmdir() removes the directory only while it is empty, so unpacked files stay.
+  // rmdir() removes the directory only while it is empty. Unpacked files therefore stay.
   if (isMade && !unpacked) ::rmdir(directory.c_str());
   return unpacked;
 }

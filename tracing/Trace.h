@@ -31,8 +31,9 @@ class Trace {
   void addTraceDataToCollect(std::unique_ptr<TraceInterval> interval);
   // Passes the events to every measurement, in the order in which the measurements were added.
   void processTracepoints(const TraceData::Session& session, const TraceData::Events& events);
-  // Adds the results of all measurements to the trace's own and returns these. A second call adds
-  // them again and returns every value twice, which is required. Call it once.
+  // Adds the results of all measurements to the results of the trace, and returns the results of
+  // the trace. A second call adds them again and returns every value twice, which is required. Call
+  // it once.
   Results getResults();
 
  private:

@@ -8,8 +8,8 @@ struct spa_pod;
 
 namespace halvox::pipewire_reporter {
 
-// Parameters come from other processes, so these functions accept anything, null included. Any
-// thread may call.
+// Parameters come from other processes. These functions therefore accept anything, null included.
+// Any thread may call.
 
 // Returns the format in a Format parameter; std::nullopt if it is not a readable audio format.
 std::optional<StreamFormat> decodeFormat(const spa_pod* param);

@@ -29,7 +29,7 @@ void require(bool condition) {
 }
 
 // Decoded values may use this much more memory than their bytes on the wire. The worst case is a
-// dictionary of one entry, which has room for four, in some 16 bytes.
+// dictionary with one entry in some 16 bytes: the decoded dictionary has room for four entries.
 constexpr std::size_t kMaxGrowth = 24;
 
 // Everything that was decoded can be printed, and written and read again with the same result.
