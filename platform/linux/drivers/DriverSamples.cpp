@@ -138,6 +138,16 @@ void appendDifference(const ChannelDescription& channel, Numbers previous, Numbe
   }
 }
 
+// Whether no state of a state channel held for any time. A node that disappeared before the session
+// has such a channel.
+bool hadNoState(const ChannelDescription& channel, Numbers differences) {
+  if (channel.format != IOReportFormat::kState) return false;
+  for (std::size_t number = 1; number < differences.size(); number += 2) {
+    if (differences[number] != 0) return false;
+  }
+  return true;
+}
+
 }  // namespace
 
 void DriverSamples::iterate(const IOReportService::Visitor& visitor) const {
@@ -160,7 +170,13 @@ std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
       // Skip a channel that appeared after the first sample, because its values may include counts
       // from before that sample.
       if (found == before.end()) continue;
+      const std::size_t begin = reading->values.size();
       appendDifference(*channel, found->second, valuesOf(*now, position), reading->values);
+      // Its report would be an empty text.
+      if (hadNoState(*channel, Numbers(reading->values).subspan(begin))) {
+        reading->values.resize(begin);
+        continue;
+      }
       channels.push_back(channel);
     }
   }

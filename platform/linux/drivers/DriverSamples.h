@@ -33,7 +33,8 @@ class DriverSamples final : public IOReportSamples {
 
 // The change from `previous` to `current`, of the channels that are in both. A channel that is only
 // in one of them is skipped, because its start or end value is unknown. This also concerns the
-// channels of a source that was late for one of them. The differences are those that
+// channels of a source that was late for one of them. A state channel whose states held no time in
+// between is skipped too: it has nothing to report. The differences are those that
 // IOReportCreateSamplesDelta promises.
 [[nodiscard]] std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
                                                              const DriverSamples& current);

@@ -97,6 +97,15 @@ TEST(DriverSamplesTest, StatesAreSubtractedAndTheDutyCycleIsThatOfTheTimeBetween
   EXPECT_THAT(dutyCycles, ElementsAre(0.75, 0.25));
 }
 
+TEST(DriverSamplesTest, AStateChannelWhoseStatesHeldNoTimeIsNotInTheDifference) {
+  const auto still = stateChannel({"on", "off"});
+  const auto frames = simpleChannel("Tx", "frames");
+
+  EXPECT_THAT(deltaOf(makeReading({still, frames}, {1, 1000, 1, 50, 7}),
+                      makeReading({still, frames}, {3, 1000, 2, 50, 9})),
+              ElementsAre("-/Tx/-/frames  = 2"));
+}
+
 TEST(DriverSamplesTest, AStateChannelThatBeganAnewCountsFromZeroAsAWhole) {
   const auto channel = stateChannel({"on", "off"});
 

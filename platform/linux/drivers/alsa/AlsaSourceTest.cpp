@@ -130,8 +130,9 @@ TEST_F(AlsaSourceTest, FramesGoOnWhenTheStreamIsPreparedAnew) {
     writeStatus("card0/pcm0p", "RUNNING", 400, 600);
   });
 
-  EXPECT_EQ(lines[3], "HDA Intel PCH/Tx/ALC269VC Analog/frames frames = 1400");
-  EXPECT_EQ(lines[4], "HDA Intel PCH/Tx/ALC269VC Analog/application frames frames = 1600");
+  EXPECT_THAT(lines, ::testing::IsSupersetOf(
+                         {"HDA Intel PCH/Tx/ALC269VC Analog/frames frames = 1400",
+                          "HDA Intel PCH/Tx/ALC269VC Analog/application frames frames = 1600"}));
 }
 
 TEST_F(AlsaSourceTest, FramesOfANewOwnerCountFromZeroEvenWhenThereAreMore) {
@@ -140,7 +141,7 @@ TEST_F(AlsaSourceTest, FramesOfANewOwnerCountFromZeroEvenWhenThereAreMore) {
   const auto lines =
       change([this] { writeStatus("card1/pcm0p", "RUNNING", 100'000, 101'000, 3003); });
 
-  EXPECT_EQ(lines[3], "Scarlet Two/Tx/USB Audio/frames frames = 100000");
+  EXPECT_THAT(lines, Contains("Scarlet Two/Tx/USB Audio/frames frames = 100000"));
 }
 
 TEST_F(AlsaSourceTest, AnXrunIsATransition) {
