@@ -69,9 +69,19 @@ IOReportService::Samples createDelta(const DriverSnapShot& snapShot, const std::
   return delta;
 }
 
-void send(const HVReportingDriverUtility::DriverStats& stats, AudioEventType type,
+// If the session reports one of several streams of a program, its messages say which: an event in
+// the store has the application, but not the session.
+void addStream(HVReportingDriverUtility::DriverStats& stats, const HVReportingSession& session) {
+  static const platform::Key key("object_serial");
+  const platform::Dictionary configuration = session.configuration();
+  if (const platform::Value* serial = configuration.find(key)) stats.set(key, *serial);
+}
+
+void send(HVReportingDriverUtility::DriverStats& stats, AudioEventType type,
           const std::shared_ptr<HVReportingSession>& session) {
+  // Tested first: the stream alone is not worth a message.
   if (stats.empty()) return;
+  addStream(stats, *session);
   session->sendMessage(stats, AudioEventCategory::kIOReporting, type, nullptr);
   HVReportingTallyhubBridge::handleEvent(stats, AudioEventCategory::kIOReporting, type, session);
 }

@@ -337,6 +337,35 @@ TEST_F(HVReportingDriverUtilityTest, EachMessageGoesToTheSessionThenToAnalytics)
   EXPECT_EQ(std::count(first, all.end(), sending), 2);
 }
 
+TEST_F(HVReportingDriverUtilityTest, TheMessagesOfAStreamHaveItsSerial) {
+  Channel state = simpleChannel("s", 0);
+  state.format = IOReportFormat::kState;
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1), state});
+  const auto utility = makeUtility();
+  session_->updateConfigurationWithContentsOfConfiguration({{"object_serial", 55}});
+  session_->setDriverSnapShot(utility.getSnapShot());
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 2), state});
+
+  utility.sendDriverLogsForSession(session_);
+
+  ASSERT_EQ(recorded().size(), 2U);
+  for (const Dictionary& message : recorded()) {
+    ASSERT_TRUE(message.contains("object_serial"));
+    EXPECT_EQ(message.find("object_serial")->toInt64(), 55);
+  }
+}
+
+TEST_F(HVReportingDriverUtilityTest, ASerialAloneIsNotSent) {
+  platform_.ioReport.setGroup("Speaker-(null)", {simpleChannel("a", 1)});
+  const auto utility = makeUtility();
+  session_->updateConfigurationWithContentsOfConfiguration({{"object_serial", 55}});
+  session_->setDriverSnapShot(utility.getSnapShot());
+
+  utility.sendDriverLogsForSession(session_);
+
+  EXPECT_TRUE(recorded().empty());
+}
+
 TEST_F(HVReportingDriverUtilityTest, LinesGoUnderTheUtilitysName) {
   const HVReportingDriverUtility utility;
 
