@@ -12,7 +12,7 @@ void NodeDirectory::set(GlobalID id, std::uint64_t serial, const Properties& pro
   nodes_.insert_or_assign(
       id, Node{.id = id,
                .serial = serial,
-               .name = cleanText(property(properties, "node.name")),
+               .name = nodeName(properties, serial),
                .process = cleanText(property(properties, "application.process.binary"))});
 }
 

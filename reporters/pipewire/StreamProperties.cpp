@@ -16,6 +16,8 @@ struct KeyName {
 };
 
 constexpr std::array kTexts{
+    // PipeWire itself does not set it. Some programs do.
+    KeyName{"application.desktop", "desktop_entry"},
     KeyName{"application.id", "application_id"},
     KeyName{"application.name", "application_name"},
     KeyName{"application.process.binary", "process_binary"},
@@ -28,6 +30,8 @@ constexpr std::array kTexts{
     KeyName{"node.description", "node_description"},
     KeyName{"node.latency", "node_latency"},
     KeyName{"node.name", "node_name"},
+    // Of a sandboxed application, such as a Flatpak's.
+    KeyName{"pipewire.access.portal.app_id", "portal_app_id"},
 };
 
 constexpr std::array kNumbers{
@@ -88,8 +92,8 @@ ServiceType serviceTypeForRole(std::string_view role) {
 
 platform::Dictionary makeConfiguration(const Properties& properties) {
   platform::Dictionary configuration{{"audio_framework", "PipeWire"}};
-  const auto application =
-      firstText(properties, {"application.id", "application.name", "node.name"});
+  const auto application = firstText(properties, {"application.id", "pipewire.access.portal.app_id",
+                                                  "application.name", "node.name"});
   if (!application.empty()) {
     configuration.set(kApplicationKey, application);
   }
@@ -104,6 +108,11 @@ platform::Dictionary makeConfiguration(const Properties& properties) {
     }
   }
   return configuration;
+}
+
+std::string nodeName(const Properties& properties, std::uint64_t serial) {
+  std::string name = cleanText(property(properties, "node.name"));
+  return name.empty() ? "node-" + std::to_string(serial) : name;
 }
 
 std::string processName(const Properties& properties) {

@@ -27,6 +27,9 @@ ServiceType serviceTypeForRole(std::string_view role);
 // numbers that do not parse. Texts are cleaned (see cleanText).
 platform::Dictionary makeConfiguration(const Properties& properties);
 
+// Returns the name of a node, or one made from its serial if it has none. Never empty.
+std::string nodeName(const Properties& properties, std::uint64_t serial);
+
 // Returns the name of a stream's process: its binary, else the name of the application, else the
 // name of the node, else "Unknown".
 std::string processName(const Properties& properties);

@@ -35,6 +35,10 @@ TEST(MakeConfigurationTest, NamesApplicationByIdThenNameThenNode) {
   properties["application.name"] = "Player";
   EXPECT_EQ(*makeConfiguration(properties).find(kApplicationKey), platform::Value("Player"));
 
+  properties["pipewire.access.portal.app_id"] = "org.example.Sandboxed";
+  EXPECT_EQ(*makeConfiguration(properties).find(kApplicationKey),
+            platform::Value("org.example.Sandboxed"));
+
   properties["application.id"] = "org.example.Player";
   EXPECT_EQ(*makeConfiguration(properties).find(kApplicationKey),
             platform::Value("org.example.Player"));
@@ -51,16 +55,30 @@ TEST(MakeConfigurationTest, TakesStreamPropertiesOver) {
                                                 {"media.class", "Stream/Output/Audio"},
                                                 {"node.latency", "1024/48000"},
                                                 {"object.serial", "55"},
+                                                {"application.desktop", "player.desktop"},
+                                                {"pipewire.access.portal.app_id", "org.player"},
                                                 {"some.other", "thing"}});
 
   const platform::Dictionary expected{{"audio_framework", "PipeWire"},
                                       {"process_binary", "player"},
                                       {"media_class", "Stream/Output/Audio"},
                                       {"media_role", "Music"},
+                                      {"desktop_entry", "player.desktop"},
+                                      {"portal_app_id", "org.player"},
+                                      {kApplicationKey, "org.player"},
                                       {"node_latency", "1024/48000"},
                                       {"process_id", 4711},
                                       {"object_serial", 55}};
   EXPECT_EQ(configuration, expected);
+}
+
+TEST(MakeConfigurationTest, EmptyPropertiesHaveNoEntry) {
+  const auto configuration = makeConfiguration({{"application.desktop", ""},
+                                                {"application.process.id", ""},
+                                                {"media.role", ""},
+                                                {"pipewire.access.portal.app_id", ""}});
+
+  EXPECT_EQ(configuration, (platform::Dictionary{{"audio_framework", "PipeWire"}}));
 }
 
 TEST(MakeConfigurationTest, CleansTextsAndOmitsWrongNumbers) {
@@ -73,6 +91,12 @@ TEST(MakeConfigurationTest, CleansTextsAndOmitsWrongNumbers) {
   EXPECT_LE(configuration.find("node_name")->string().size(), kMaxTextBytes);
   EXPECT_FALSE(configuration.contains("process_id"));
   EXPECT_FALSE(configuration.contains("object_serial"));
+}
+
+TEST(NodeNameTest, ANodeWithoutANameIsNamedByItsSerial) {
+  EXPECT_EQ(nodeName({{"node.name", "player\n"}}, 55), "player\xEF\xBF\xBD");
+  EXPECT_EQ(nodeName({{"node.name", ""}}, 55), "node-55");
+  EXPECT_EQ(nodeName({}, 55), "node-55");
 }
 
 TEST(ProcessNameTest, PrefersBinaryThenApplicationThenNode) {

@@ -8,7 +8,6 @@ namespace halvox::pipewire_reporter {
 namespace {
 
 constexpr std::string_view kRoleProperty = "media.role";
-constexpr std::string_view kNodeProperty = "node.name";
 
 // Returns the entries of `now` that are new or differ from those of `before`.
 platform::Dictionary changedEntries(const platform::Dictionary& before,
@@ -76,7 +75,7 @@ StreamSession::StreamSession(ReportingClient& client, Identity identity,
       serviceType_(serviceTypeForRole(property(properties, kRoleProperty))),
       configuration_(makeConfiguration(properties)),
       process_(processName(properties)),
-      node_(cleanText(property(properties, kNodeProperty))),
+      node_(nodeName(properties, identity.serial)),
       xruns_(identity.node) {
   client_.createSession(identity_.reporterID);
   client_.setServiceType(identity_.reporterID, serviceType_);
@@ -94,7 +93,7 @@ StreamSession::~StreamSession() {
 
 void StreamSession::setProperties(const Properties& properties) {
   process_ = processName(properties);
-  node_ = cleanText(property(properties, kNodeProperty));
+  node_ = nodeName(properties, identity_.serial);
   const ServiceType type = serviceTypeForRole(property(properties, kRoleProperty));
   if (type != serviceType_) {
     serviceType_ = type;

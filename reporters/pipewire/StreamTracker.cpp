@@ -11,14 +11,9 @@ constexpr std::uint64_t kNamespace = 0x5057;  // "PW"; its top bit is clear, so 
 // The ID of a driver that the profiler does not name. No node has it.
 constexpr GlobalID kNoNode = 0xFFFFFFFF;
 
-// Returns the name of a device, or one made from its serial if it has none.
-std::string deviceName(std::string name, std::uint64_t serial) {
-  return name.empty() ? "node-" + std::to_string(serial) : std::move(name);
-}
-
 Route::Device makeDevice(const StreamTracker::Node& node) {
   Route::Device device;
-  device.name = deviceName(cleanText(property(node.properties, "node.name")), node.serial);
+  device.name = nodeName(node.properties, node.serial);
   device.description = cleanText(property(node.properties, "node.description"));
   if (device.description.empty()) {
     device.description = device.name;
@@ -137,7 +132,7 @@ DeviceXrun StreamTracker::makeXrun(const pipewire::ProfiledCycle& cycle,
   if (cycle.driver.has_value()) {
     driver = nodes_.describe(cycle.driver->id, cycle.driverName);
     xrun.driver = driver.id;
-    xrun.device = deviceName(driver.name, driver.serial.value_or(0));
+    xrun.device = driver.name;
   }
   switch (loss.fault) {
     case pipewire::CycleFault::kUnknown:

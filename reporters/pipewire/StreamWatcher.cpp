@@ -34,6 +34,7 @@ constexpr milliseconds kReconnectMin{100};
 constexpr milliseconds kReconnectMax{5000};
 constexpr std::string_view kClientIDProperty = "client.id";
 constexpr std::string_view kSerialProperty = "object.serial";
+constexpr const char* kPortalProperty = "pipewire.access.portal.app_id";
 
 // Returns the number under a key, or 0 when there is none or it is too large.
 GlobalID idProperty(const Properties& properties, std::string_view key) {
@@ -52,6 +53,11 @@ void fillIn(Properties& properties, std::string_view key, std::string_view value
 // stream's own properties take precedence.
 Properties withClient(const Properties& stream, const Properties& client) {
   Properties all = stream;
+  // The server determines the application of a sandbox. A stream must not claim to be in one.
+  all.erase(kPortalProperty);
+  if (const auto application = property(client, kPortalProperty); !application.empty()) {
+    fillIn(all, kPortalProperty, application);
+  }
   for (const auto& [key, value] : client) {
     if (key.starts_with("application.") || key == "client.api") {
       fillIn(all, key, value);
