@@ -13,6 +13,8 @@
 #   halvox_audio_start DIRECTORY      # starts and waits; exports what clients need
 #   halvox_audio_stop
 #
+# HALVOX_AUDIO_SINK names another factory for the sink. SPA_PLUGIN_DIR says where PipeWire looks for it.
+#
 # DIRECTORY must exist, and must be short: a socket's path has at most 107 bytes.
 
 HALVOX_AUDIO_TOOLS=(dbus-daemon pipewire wireplumber pw-cli pw-dump pw-play pw-record)
@@ -39,7 +41,7 @@ halvox_audio_write_configuration() {
     >"$directory/config/wireplumber/main.lua.d/60-no-hardware.lua"
   printf 'bluez_monitor.enabled = false\n' \
     >"$directory/config/wireplumber/bluetooth.lua.d/60-no-hardware.lua"
-  cat >"$directory/pipewire.conf" <<'END'
+  cat >"$directory/pipewire.conf" <<END
 context.properties = {
     core.daemon = true
     core.name = pipewire-0
@@ -50,6 +52,7 @@ context.properties = {
 context.spa-libs = {
     audio.convert.* = audioconvert/libspa-audioconvert
     support.* = support/libspa-support
+    halvox.* = halvox-counting-sink
 }
 context.modules = [
     { name = libpipewire-module-protocol-native }
@@ -67,7 +70,7 @@ context.modules = [
 context.objects = [
     { factory = adapter
       args = {
-        factory.name = support.null-audio-sink
+        factory.name = ${HALVOX_AUDIO_SINK:-support.null-audio-sink}
         node.name = demo-speakers
         node.description = "Demo speakers"
         media.class = Audio/Sink

@@ -1,6 +1,7 @@
 """A private PipeWire with WirePlumber and a null sink, and the reporter that follows it."""
 
 import itertools
+import json
 import math
 import os
 import shutil
@@ -13,6 +14,7 @@ from pathlib import Path
 from harness import BIN, stop_process, voluntary_switches, wait_for
 
 REPORTER = BIN / "halvox-pipewire-reporter"
+AUDIO_CLIENT = BIN / "halvox_audio_client"
 PRIVATE_PIPEWIRE = Path(__file__).resolve().parents[2] / "scripts/lib/private-pipewire.sh"
 
 
@@ -24,13 +26,26 @@ def missing():
     return check.stdout.strip()
 
 
+def plugin_directory():
+    """Where PipeWire's own plugins are."""
+    return subprocess.run(["pkg-config", "--variable=plugindir", "libspa-0.2"], check=True,
+                          capture_output=True, text=True).stdout.strip()
+
+
 class Audio:
-    """The private PipeWire. Use as a context manager; children get `environment`."""
+    """The private PipeWire. Use as a context manager; children get `environment`.
+
+    If it counts xruns, its sink has one for each cycle that was not finished in time, as a device
+    without a reserve has. The usual sink has no hardware and counts none."""
+
+    def __init__(self, counts_xruns=False):
+        self._variables = {"HALVOX_AUDIO_SINK": "halvox.counting-sink",
+                           "SPA_PLUGIN_DIR": f"{plugin_directory()}:{BIN}"} if counts_xruns else {}
 
     def __enter__(self):
         self.directory = Path(tempfile.mkdtemp(prefix="halvox-audio-"))
         self._server = subprocess.Popen(
-            [PRIVATE_PIPEWIRE, "serve", self.directory],
+            [PRIVATE_PIPEWIRE, "serve", self.directory], env={**os.environ, **self._variables},
             stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True)
         try:
             self._expect("ready")
@@ -82,6 +97,61 @@ class Audio:
 
     def play(self, seconds, volume=0.5, role="Music"):
         return self.run("pw-play", "--volume", str(volume), "--media-role", role, self.tone(seconds))
+
+
+class Player:
+    """A program that plays silence in cycles of that many frames, and can be made to stall."""
+
+    def __init__(self, audio, name, frames):
+        self.name = name
+        self._process = subprocess.Popen(
+            [AUDIO_CLIENT, "play", name, str(frames)], env=audio.environment,
+            stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True)
+        line = self._process.stdout.readline().strip()
+        if line != "running":
+            self.stop()
+            raise AssertionError(f"the player {name} said {line!r} instead of 'running'")
+
+    def stall(self, seconds):
+        """Sleeps that long in the next cycle."""
+        self._process.stdin.write(f"stall {int(seconds * 1000)}\n")
+        self._process.stdin.flush()
+
+    def stop(self):
+        """Does nothing if it has been stopped."""
+        self._process.stdin.close()
+        self._process.wait(30)
+        self._process.stdout.close()
+
+
+class Profile:
+    """What PipeWire's profiler reports, read without the code that is tested."""
+
+    # The status of a node that was called and has not finished.
+    LATE = (1, 2)
+
+    def __init__(self, audio):
+        self._path = audio.directory / "profile.jsonl"
+        with open(self._path, "wb") as file:
+            self._process = subprocess.Popen([AUDIO_CLIENT, "profile"], env=audio.environment,
+                                             stdin=subprocess.PIPE, stdout=file)
+
+    def cycles(self):
+        """The cycles so far, each once, oldest first: when, how many xruns until then, and the IDs
+        of the nodes that were late."""
+        cycles = {}
+        for line in self._path.read_text().splitlines(keepends=True):
+            if not line.endswith("\n"):
+                break  # being written
+            event = json.loads(line)
+            late, _ = cycles.get(event["time"], (set(), 0))
+            late |= {node for node, status in event["followers"] if status in self.LATE}
+            cycles[event["time"]] = late, event["xruns"]
+        return [(time, xruns, late) for time, (late, xruns) in sorted(cycles.items())]
+
+    def stop(self):
+        self._process.stdin.close()
+        self._process.wait(30)
 
 
 class Reporter:

@@ -1,0 +1,153 @@
+"""Cycles that a player misses on purpose: who was late, who suffered, and whether the counts add up."""
+
+import contextlib
+import time
+import unittest
+
+import audio
+from harness import Service, require, wait_for
+
+FRAMES = 8192
+RATE = 48000
+# PipeWire reports its cycles once a second, and the reporter sends at most one report a second.
+SETTLED = 2.5
+STALL = 1.5
+CULPRIT, VICTIMS = "culprit", ("victim-a", "victim-b")
+
+
+@unittest.skipIf(audio.missing(), audio.missing())
+class GlitchTest(unittest.TestCase):
+    def run_streams(self, counts_xruns):
+        """Starts three streams on one device, and waits until they run without a glitch."""
+        require("pkg-config")
+        stack = contextlib.ExitStack()
+        self.addCleanup(stack.close)
+        self.audio = stack.enter_context(audio.Audio(counts_xruns))
+        # The service finds PipeWire where a user's programs do.
+        runtime = self.audio.environment["XDG_RUNTIME_DIR"]
+        self.service = stack.enter_context(Service(environment={"XDG_RUNTIME_DIR": runtime}))
+        stack.enter_context(audio.Reporter(self.audio, self.service))
+        self.profile = audio.Profile(self.audio)
+        stack.callback(self.profile.stop)
+        self.players = {}
+        for name in (CULPRIT, *VICTIMS):
+            self.players[name] = audio.Player(self.audio, name, FRAMES)
+            stack.callback(self.players[name].stop)
+        self.serials = wait_for("the three streams to start", self.started_serials)
+        self.wait_until_settled(time.monotonic())
+
+    def messages(self, name):
+        """The payloads of the messages with that name, oldest first."""
+        return [payload for event, payload in self.service.events()
+                if event == f"com.tarno.halvox.{name}"]
+
+    def started_serials(self):
+        serials = [start["object_serial"] for start in self.messages("Session_Playback.Start")]
+        return serials if len(serials) == 3 else None
+
+    def missed(self, since):
+        """The cycles that the profiler shows as missed since that time."""
+        return [cycle for cycle in self.profile.cycles() if cycle[2] and cycle[0] > since * 1e9]
+
+    def wait_until_settled(self, since):
+        """Waits until cycles run and were not missed for so long that all reports were sent."""
+        def settled():
+            now = time.monotonic()
+            last = self.profile.cycles()[-1][0] / 1e9 if self.profile.cycles() else 0
+            return last > since + SETTLED and not self.missed(now - SETTLED - 1)
+        wait_for("cycles without a glitch", settled, 120)
+
+    def reports(self):
+        """The reports of missed cycles by the name of the node, oldest first."""
+        reports = {name: [] for name in self.players}
+        for issue in self.messages("Session_Playback.IssueDetector"):
+            reports[issue["node"]].append(issue)
+        return reports
+
+    def stall(self):
+        """Lets the culprit stall. Returns the missed cycles, the xruns and the reports of that."""
+        before = {name: len(reports) for name, reports in self.reports().items()}
+        since = time.monotonic()
+        self.players[CULPRIT].stall(STALL)
+        # The last cycle may be cut short by the end of the stall.
+        least = int(STALL * RATE / FRAMES) - 2
+        wait_for("the stall to be profiled", lambda: len(self.missed(since)) >= least)
+        self.wait_until_settled(time.monotonic())
+
+        cycles = self.profile.cycles()
+        earlier = [xruns for when, xruns, _ in cycles if when <= since * 1e9][-1]
+        xruns = cycles[-1][1] - earlier
+        return self.missed(since), xruns, {name: reports[before[name]:]
+                                           for name, reports in self.reports().items()}
+
+    def check_shares(self, missed, reports):
+        """Each stream reports all cycles that the device missed."""
+        for name, own in reports.items():
+            self.assertEqual(sum(report["missed_cycles"] for report in own), len(missed), name)
+            for report in own:
+                self.assertAlmostEqual(report["xrun_milliseconds"],
+                                       report["missed_cycles"] * FRAMES / RATE * 1000, places=3)
+                self.assertAlmostEqual(report["any_channel_silence_seconds"] * 1000,
+                                       report["xrun_milliseconds"], places=3)
+
+    def check_roles(self, reports):
+        """The culprit is named by all. Roles are weighed, because a busy machine may make the others
+        late too, but not in most cycles of the stall."""
+        serial = reports[CULPRIT][0]["object_serial"]
+        for name, own in reports.items():
+            cycles = {}
+            for report in own:
+                key = report["xrun_role"], report["late_node"], report["late_object_serial"]
+                cycles[key] = cycles.get(key, 0) + report["missed_cycles"]
+            role = "culprit" if name == CULPRIT else "victim"
+            self.assertEqual(max(cycles, key=cycles.get), (role, CULPRIT, serial), name)
+
+    def check_circumstances(self, reports):
+        for own in reports.values():
+            for report in own:
+                self.assertEqual(
+                    (report["issue_type"], report["quantum"], report["rate"],
+                     report["device_node_name"], report["late_process"]),
+                    ("xrun", FRAMES, RATE, "demo-speakers", "halvox_audio_client"))
+        # Two streams of one program differ in their serials.
+        serials = {name: {report["object_serial"] for report in own} for name, own in reports.items()}
+        self.assertEqual(sorted(serial for own in serials.values() for serial in own),
+                         sorted(self.serials))
+
+    def test_the_shares_add_up_to_what_the_driver_counted(self):
+        self.run_streams(counts_xruns=True)
+
+        missed, xruns, reports = self.stall()
+
+        self.assertEqual(len(missed), xruns)
+        self.check_shares(missed, reports)
+        self.check_roles(reports)
+        self.check_circumstances(reports)
+        self.check_statistics(xruns)
+
+    def check_statistics(self, xruns):
+        """The counters of a stream's session say whose they are, and have the driver's xruns."""
+        for player in self.players.values():
+            player.stop()
+        simple = wait_for("the counters of three sessions", lambda: (
+            found := self.messages("IOReporting.Simple")) and len(found) == 3 and found)
+        self.assertEqual(sorted(counters["object_serial"] for counters in simple),
+                         sorted(self.serials))
+        for counters in simple:
+            self.assertGreaterEqual(counters["demo-speakers_Speaker_PipeWire_Simple_xruns"], xruns)
+        for kind in ("Simple", "Histogram", "State"):
+            for counters in self.messages(f"IOReporting.{kind}"):
+                self.assertNotIn("", counters.values(), kind)
+
+    def test_the_shares_add_up_on_a_driver_that_counts_no_xruns(self):
+        self.run_streams(counts_xruns=False)
+
+        missed, xruns, reports = self.stall()
+
+        self.assertEqual(xruns, 0)
+        self.check_shares(missed, reports)
+        self.check_roles(reports)
+
+
+if __name__ == "__main__":
+    unittest.main()
