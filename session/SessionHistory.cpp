@@ -13,7 +13,7 @@ constexpr std::size_t kLeastToMove = 4 * 1024;
 // Bytes that one history may hold in memory: tens of thousands of ordinary messages, so that most
 // sessions never touch the disk.
 constexpr std::size_t kMostInMemory = 1024 * 1024;
-// As often as the store tries to write again.
+// The pause before a write that failed is tried again. The store has the same one.
 constexpr std::chrono::milliseconds kRetryTime{250};
 
 // Errors are never suppressed, however often they repeat. The category is compared as a whole. An

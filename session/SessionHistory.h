@@ -56,7 +56,7 @@ class SessionHistory {
                        const platform::Dictionary& message);
 
  private:
-  // Both are called with the history locked.
+  // makeRoom() and tryToMoveOut() are called with the history locked.
   [[nodiscard]] bool makeRoom(MessageHistory& messages);
   [[nodiscard]] bool tryToMoveOut(MessageHistory& messages);
   [[nodiscard]] bool isClientOverItsShare() const;

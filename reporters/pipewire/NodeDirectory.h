@@ -12,25 +12,26 @@
 
 namespace halvox::pipewire_reporter {
 
-// Knows who the nodes of a server are, to name the ones that were late.
+// Knows the names, serials and processes of a server's nodes, to identify the nodes that were late.
 //
-// The profiler reports up to a second later. A program that stalls and is then killed has no node
-// any more, and the server may have given the ID to another. The directory therefore also remembers
-// the last nodes that have disappeared, and compares the names.
-// A plain value that belongs to the loop thread. Bounded: any client can create nodes.
+// The profiler reports a cycle up to a second later. A program that stalls and is then killed has
+// no node any more by then, and the server may have given the node's ID to another node. The
+// directory therefore also remembers the last nodes that have disappeared, and compares the names.
+// A plain value that belongs to the loop thread. Its size is bounded, because any client can create
+// nodes.
 class NodeDirectory {
  public:
   static constexpr std::size_t kMaxNodes = 16384;  // further ones stay unknown
   static constexpr std::size_t kMaxGone = 64;      // the oldest is forgotten
 
-  // A node has these properties. Replaces what was known of the ID.
+  // Stores the properties of a node. Replaces what was known of this ID.
   void set(GlobalID id, std::uint64_t serial, const Properties& properties);
-  // An unknown ID is ignored.
+  // The node has disappeared. An unknown ID is ignored.
   void remove(GlobalID id);
   void clear();
 
   // Returns what is known of the node that had this ID when the profiler called it `name`. Without
-  // a name, it is the node that has the ID now.
+  // a name, returns what is known of the node that has the ID now.
   [[nodiscard]] LateNode describe(GlobalID id, std::string_view name) const;
 
  private:

@@ -47,13 +47,13 @@ inline constexpr const char* kIssueXrun = "xrun";
 inline constexpr const char* kNodeKey = "node";
 inline constexpr const char* kIssueClientKey = "rtaid_client";
 inline constexpr const char* kSilenceKey = "any_channel_silence_seconds";
-// The same time in milliseconds, the number of missed cycles, and the length of a cycle in frames
-// and the rate in Hz that were in force.
+// How long nothing was heard in milliseconds, the number of missed cycles, the length of a cycle in
+// frames at that time, and the rate in Hz.
 inline constexpr const char* kXrunMillisecondsKey = "xrun_milliseconds";
 inline constexpr const char* kMissedCyclesKey = "missed_cycles";
 inline constexpr const char* kQuantumKey = "quantum";
 inline constexpr const char* kRateKey = "rate";
-// The device that missed the cycles, the node that was late, and what the stream was.
+// The device that missed the cycles, the node that was late, and the role of the stream in it.
 inline constexpr const char* kXrunDeviceKey = "device_node_name";
 inline constexpr const char* kLateNodeKey = "late_node";
 inline constexpr const char* kLateSerialKey = "late_object_serial";

@@ -47,8 +47,8 @@ class StreamSession {
   // Volume controls of the stream have changed. Sends the volume if it or the playing
   // state differs from the last message.
   void changeVolume(const VolumeChange& change);
-  // A device on which the stream ran missed cycles. A later reportXruns() reports them. Ignored
-  // while the stream does not run.
+  // Call when a device on which the stream ran has missed cycles. A later reportXruns() reports
+  // them. Ignored while the stream does not run.
   void addXrun(const DeviceXrun& xrun);
   // Reports what the stream has lost, at most once a second.
   void reportXruns(XrunMeter::Time now);

@@ -74,9 +74,10 @@ class StreamTracker {
   void streamVolumeChanged(GlobalID id, const VolumeChange& change);
   // The profiler begins to report cycles. Xruns before this call were not reported.
   void profilingBegan() { missed_.clear(); }
-  // A driver of the server ended a cycle. If it missed it, each running stream that took part has
-  // lost as much: streams that were late, and streams that suffered from it. If the profiler does
-  // not list the nodes that took part, these are the streams that are linked to the driver.
+  // Call when a driver of the server has ended a cycle. If the driver missed the cycle, each
+  // running stream that took part has lost it, whether the stream was late or suffered from
+  // another. If the profiler does not list the nodes that took part, the streams that are linked to
+  // the driver have lost it.
   void cycleEnded(const pipewire::ProfiledCycle& cycle);
 
   [[nodiscard]] std::size_t streamCount() const { return streams_.size(); }

@@ -12,8 +12,9 @@ import time
 
 from harness import DEADLINE, WITH_US, stop_process
 
-# One process for everything that can share one: two processors serve all tests. No sandbox: it needs
-# rights that a container does not give. The rest keeps Chromium from looking for a network.
+# Everything that can share a process does, because two processors serve all tests. There is no
+# sandbox, because it needs rights that a container does not give. The other options keep Chromium
+# from looking for a network.
 OPTIONS = [
     "--headless", "--no-sandbox", "--disable-gpu", "--remote-debugging-pipe", "--no-first-run",
     "--disable-background-networking", "--disable-component-update", "--disable-sync",

@@ -2,8 +2,8 @@
 //
 //   node build.mjs OUTPUT.cpp
 //
-// Reads the libraries from node_modules below the working directory: the build keeps them in the
-// build folder. Needs no network.
+// Reads the libraries from node_modules below the working directory, which is in the build folder.
+// Needs no network.
 import { createHash } from "node:crypto";
 import { readFile, readdir, writeFile } from "node:fs/promises";
 import { createRequire } from "node:module";
@@ -31,7 +31,7 @@ async function bundle(entry) {
   return { text: built.outputFiles[0].text.trim(), inputs: Object.keys(built.metafile.inputs) };
 }
 
-// The packages that are in the bundle: their licenses ask for their notices beside every copy.
+// The packages that are in the bundle. Their licenses ask for a notice in every copy.
 function packagesOf(inputs) {
   const names = new Set();
   for (const input of inputs) {
@@ -69,7 +69,7 @@ const [output] = process.argv.slice(2);
 const script = await bundle("page.js");
 const style = await bundle("page.css");
 const hash = createHash("sha256").update(script.text).digest("base64");
-// Any of these would end the element early, or keep it from ending.
+// Any of these texts would end the element early, or keep it from ending.
 for (const { text } of [script, style]) {
   const found = text.match(/<\/(script|style)|<!--/i);
   if (found) throw new Error(`the bundle contains ${found[0]}`);

@@ -150,7 +150,8 @@ export function traceIntervals(intervals) {
   ];
 }
 
-// How many of each name over time, stacked; the most frequent names apart.
+// How many messages of each name there were over time, stacked. The most frequent names have colours
+// of their own; the others are added up.
 export function eventsOverTime(names) {
   const { from, step, series } = names;
   const top = series.filter((one) => one.drawn).slice(0, 7);

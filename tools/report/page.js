@@ -207,6 +207,6 @@ document.getElementById("page").replaceWith(
   element("main", { id: "main", tabindex: -1 }, verdict(), figures(), ...content),
   element("footer", { class: "quiet" }, element("p", {}, `${figure(totals.events)} events, ${figure(totals.links)} messages of the link.`)),
 );
-// Tests wait for it, and measure when the page was complete.
+// Tests wait for this attribute. The mark tells them when the page was complete.
 document.documentElement.dataset.ready = "true";
 performance.mark("report-ready");

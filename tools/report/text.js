@@ -17,7 +17,7 @@ export function shortened(text, length) {
   return characters.length <= length ? characters.join("") : `${characters.slice(0, length - 1).join("")}…`;
 }
 
-// Names in tables and sentences: a client may choose 10,000 characters.
+// Names in tables and sentences are cut, because a client may choose 10,000 characters.
 const LONGEST_NAME = 80;
 export const named = (text) => shortened(text, LONGEST_NAME);
 

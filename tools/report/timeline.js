@@ -52,7 +52,8 @@ function partsOf(stream, lane, end) {
   });
 }
 
-// Places the streams of each application on as few tracks as do not overlap.
+// Places the streams of each application on as few tracks as possible, so that no two streams of a
+// track overlap.
 function lanesOf(streams, xruns, end) {
   const byApp = new Map();
   const of = (app) => byApp.get(app) ?? byApp.set(app, { app, streams: [], xruns: 0, ran: 0 }).get(app);
@@ -83,7 +84,7 @@ function lanesOf(streams, xruns, end) {
     for (let track = 0; track < Math.max(1, ends.length); track += 1) lanes.push(track === 0 ? entry.app : "");
   }
   if (hidden > 0) {
-    // The marks of the others must not be lost.
+    // The applications without a lane share one, because their marks must not be lost.
     for (const entry of ordered) if (!laneOfApp.has(entry.app)) laneOfApp.set(entry.app, lanes.length);
     lanes.push(OTHERS);
   }
@@ -166,7 +167,7 @@ export function timeline(data, onChoose) {
         }),
         axisX({ anchor: "bottom", tickFormat: timeTick(span), ticks: narrow() ? 3 : 7, label: null }),
         gridX({ ticks: narrow() ? 3 : 7, stroke: "var(--line)", strokeOpacity: 1 }),
-        // How long a stream existed, then how loud it was.
+        // The first rectangle shows how long a stream existed. Those above it show how loud it was.
         rect(streams.filter((stream) => laneOfStream.has(stream) && inside(stream.from, stream.to ?? data.period.to)), {
           x1: (stream) => clip(stream.from),
           x2: (stream) => clip(stream.to ?? data.period.to),
@@ -286,7 +287,7 @@ export function timeline(data, onChoose) {
     tip.hidden = true;
   }
 
-  // The marks in the order of time: that of the arrow keys.
+  // The marks in the order of time, in which the arrow keys visit them.
   const inOrder = points.map((xrun) => xrun.index).sort((a, b) => xruns[a].t - xruns[b].t);
 
   function focusMark(index) {
@@ -320,12 +321,12 @@ export function timeline(data, onChoose) {
     }
   });
 
-  // Zooming is d3's: the transform says which part of the whole time is shown.
+  // d3 zooms. Its transform says which part of the whole time is shown.
   const plotWidth = () => width - left() - right;
   let requested = 0;
   const zoomer = zoom()
     .scaleExtent([1, Math.max(1, (whole[1] - whole[0]) / NEAREST)])
-    // The wheel alone scrolls the page, and so does one finger.
+    // The wheel without a modifier key scrolls the page, and one finger does too.
     .filter((event) => (event.type === "wheel" ? event.ctrlKey || event.metaKey || event.shiftKey
       : event.type.startsWith("touch") ? event.touches.length > 1 : !event.button))
     .on("zoom", ({ transform }) => {
