@@ -79,7 +79,7 @@ void addStream(HVReportingDriverUtility::DriverStats& stats, const HVReportingSe
 
 void send(HVReportingDriverUtility::DriverStats& stats, AudioEventType type,
           const std::shared_ptr<HVReportingSession>& session) {
-  // Tested first: the stream alone is not worth a message.
+  // Tested before the stream is added, because a stream without statistics is not worth a message.
   if (stats.empty()) return;
   addStream(stats, *session);
   session->sendMessage(stats, AudioEventCategory::kIOReporting, type, nullptr);

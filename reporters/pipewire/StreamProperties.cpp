@@ -16,7 +16,7 @@ struct KeyName {
 };
 
 constexpr std::array kTexts{
-    // PipeWire itself does not set it. Some programs do.
+    // PipeWire itself does not set this property, but some programs do.
     KeyName{"application.desktop", "desktop_entry"},
     KeyName{"application.id", "application_id"},
     KeyName{"application.name", "application_name"},
@@ -30,7 +30,7 @@ constexpr std::array kTexts{
     KeyName{"node.description", "node_description"},
     KeyName{"node.latency", "node_latency"},
     KeyName{"node.name", "node_name"},
-    // Of a sandboxed application, such as a Flatpak's.
+    // The server sets this property for sandboxed applications, such as those of Flatpak.
     KeyName{"pipewire.access.portal.app_id", "portal_app_id"},
 };
 

@@ -36,7 +36,8 @@ constexpr std::uint32_t kRate = 48000;
 constexpr std::uint32_t kChannels = 2;
 constexpr std::uint32_t kFrameBytes = kChannels * sizeof(float);
 
-// Runs the loop, and passes on each line of standard input, on another thread.
+// Runs the loop until the end of standard input. Another thread passes each line of the input to
+// `handle`.
 void runUntilInputEnds(pw_main_loop* loop,
                        const std::function<void(const std::string& line)>& handle) {
   pw_loop* events = pw_main_loop_get_loop(loop);

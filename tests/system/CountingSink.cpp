@@ -1,8 +1,9 @@
 // A plugin for a private PipeWire: its null sink, but one that has an xrun if a cycle was not
 // finished in time, as a device without a reserve of samples has. The null sink itself counts none.
 //
-// PipeWire loads it as factory "halvox.counting-sink". It can be made once in a process. All calls
-// after its construction come from PipeWire's thread of the cycles, or while that does not use it.
+// PipeWire loads it as factory "halvox.counting-sink". It can be made once in a process. PipeWire's
+// thread of the cycles makes the calls after the construction. Other threads call only while that
+// thread does not use the sink.
 
 #include <cstddef>
 #include <cstdint>
@@ -28,7 +29,7 @@ bool wasProcessed = true;
 int onReady(void* /*data*/, int status) {
   if (!wasProcessed) spa_node_call_xrun(&listener, 0, 0, nullptr);
   const int result = spa_node_call_ready(&listener, status);
-  // After the call, in which PipeWire processes what an unfinished cycle has.
+  // Cleared after the call, in which PipeWire processes what an unfinished cycle has.
   wasProcessed = false;
   return result;
 }
@@ -83,7 +84,7 @@ int enumInterfaces(const spa_handle_factory* /*factory*/, const spa_interface_in
 }
 
 const spa_handle_factory* findInnerFactory() {
-  // Never closed: the sink's code must stay.
+  // The library is never closed, because the sink's code must stay loaded.
   void* library = dlopen(HALVOX_SPA_PLUGINS "/support/libspa-support.so", RTLD_NOW);
   if (library == nullptr) return nullptr;
   const auto list = reinterpret_cast<spa_handle_factory_enum_func_t>(

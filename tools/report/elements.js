@@ -23,9 +23,9 @@ export function section(id, heading, ...children) {
 
 const ROWS_AT_ONCE = 200;
 
-// A table with the numbers of a picture. `columns` are [heading, function that returns the content of a row's cell,
-// options]; a column with {number: true} is aligned to the right. Of a long table, only the first
-// rows are shown at first.
+// A table with the numbers of a picture. `columns` are [heading, function that returns the content
+// of a row's cell, options]; a column with {number: true} is aligned to the right. Of a long table,
+// only the first rows are shown at first.
 export function table(caption, columns, rows) {
   const body = element("tbody");
   const add = (from, to) => {
