@@ -138,8 +138,8 @@ void appendDifference(const ChannelDescription& channel, Numbers previous, Numbe
   }
 }
 
-// Whether no state of a state channel held for any time. A node that disappeared before the session
-// has such a channel.
+// True for a state channel in whose difference every state has a residency of 0, such as the
+// channel of a node that disappeared before the session.
 bool hadNoState(const ChannelDescription& channel, Numbers differences) {
   if (channel.format != IOReportFormat::kState) return false;
   for (std::size_t number = 1; number < differences.size(); number += 2) {
@@ -172,7 +172,7 @@ std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
       if (found == before.end()) continue;
       const std::size_t begin = reading->values.size();
       appendDifference(*channel, found->second, valuesOf(*now, position), reading->values);
-      // Its report would be an empty text.
+      // Skip a state channel without residencies, because its report would be an empty text.
       if (hadNoState(*channel, Numbers(reading->values).subspan(begin))) {
         reading->values.resize(begin);
         continue;

@@ -33,9 +33,9 @@ class DriverSamples final : public IOReportSamples {
 
 // The change from `previous` to `current`, of the channels that are in both. A channel that is only
 // in one of them is skipped, because its start or end value is unknown. This also concerns the
-// channels of a source that was late for one of them. A state channel whose states held no time in
-// between is skipped too: it has nothing to report. The differences are those that
-// IOReportCreateSamplesDelta promises.
+// channels of a source that was late for one of them. A state channel is also skipped if none of
+// its states held for any time in between, because such a channel has nothing to report. The
+// differences are those that IOReportCreateSamplesDelta promises.
 [[nodiscard]] std::shared_ptr<const DriverSamples> makeDelta(const DriverSamples& previous,
                                                              const DriverSamples& current);
 
