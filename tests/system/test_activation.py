@@ -16,14 +16,16 @@ import harness
 from harness import BUS_NAME, SERVICE, WITH_US, Client, Service, iterate_until, private_bus, wait_for
 
 PACKAGING = Path(__file__).parents[2] / "packaging"
-SERVICE_FILE = PACKAGING / "dbus" / f"{BUS_NAME}.service"
+SERVICE_FILE = PACKAGING / "dbus" / f"{BUS_NAME}.service.in"
+# The installation puts its own directory there.
+SHIPPED_SERVICE = "@BINDIR@/halvox-reportingd"
 BUS = "org.freedesktop.DBus"
 
 
 def shipped_unit():
     """The unit that the D-Bus service file lets systemd start."""
     name = re.search(r"^SystemdService=(.+)$", SERVICE_FILE.read_text(), re.MULTILINE)[1]
-    return name, (PACKAGING / "systemd" / name).read_text()
+    return name, (PACKAGING / "systemd" / f"{name}.in").read_text()
 
 
 class Activation(unittest.TestCase):
@@ -48,11 +50,11 @@ class Activation(unittest.TestCase):
         services = self.directory / "services"
         services.mkdir()
         text = SERVICE_FILE.read_text()
-        self.assertIn("Exec=/usr/bin/halvox-reportingd\n", text)
+        self.assertIn(f"Exec={SHIPPED_SERVICE}\n", text)
         # The service cannot be made to end with its parent, because its parent is a process of the
         # bus that ends after the start. If the test is killed, the time-out ends the service.
         command = f"{shutil.which('timeout')} 120 {SERVICE}"
-        (services / SERVICE_FILE.name).write_text(text.replace("/usr/bin/halvox-reportingd", command))
+        (services / SERVICE_FILE.stem).write_text(text.replace(SHIPPED_SERVICE, command))
         configuration = (f"<servicedir>{services}</servicedir>"
                          f"<limit name='service_start_timeout'>{10000}</limit>")
         with private_bus(configuration, options, self.environment()) as address:
@@ -105,7 +107,7 @@ class Activation(unittest.TestCase):
             iterate_until("the request to systemd", lambda: asked)
             self.assertEqual(asked, [unit_name])
             variables = dict(line.split("=", 1) for line in re.findall(r"^Environment=(.+)$", unit, re.MULTILINE))
-            self.assertIn("ExecStart=/usr/bin/halvox-reportingd\n", unit)
+            self.assertIn(f"ExecStart={SHIPPED_SERVICE}\n", unit)
             service = subprocess.Popen(
                 [*WITH_US, str(SERVICE)], stderr=subprocess.DEVNULL,
                 env={**os.environ, **self.environment(), **variables, "DBUS_SYSTEM_BUS_ADDRESS": address})

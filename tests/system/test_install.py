@@ -1,0 +1,177 @@
+"""An installation is complete: other programs find the library, systemd and D-Bus find their files."""
+
+import os
+import re
+import shutil
+import subprocess
+import tempfile
+import unittest
+import xml.etree.ElementTree as ElementTree
+from pathlib import Path
+
+from gi.repository import GLib
+
+import harness
+from harness import BIN, INTERFACE, OBJECT, Client, Service
+
+BUILD = BIN.parent
+# Prints 1 if the service answered everything.
+PROGRAM = """
+#include <halvox.h>
+#include <stdio.h>
+
+int main(void) {
+  halvox_client *client = halvox_client_new(NULL);
+  halvox_dictionary *message = halvox_dictionary_new();
+  halvox_client_create_session(client, 7);
+  halvox_client_start(client, 7);
+  halvox_dictionary_set_double(message, "volume", 0.5);
+  halvox_client_send(client, 7, message, HALVOX_DOMAIN_SESSION | HALVOX_CATEGORY_PLAYBACK,
+                     HALVOX_EVENT_START);
+  halvox_result result = halvox_client_flush(client, 30000);
+  printf("%d\\n", result == HALVOX_OK);
+  halvox_dictionary_free(message);
+  halvox_client_free(client);
+  return 0;
+}
+"""
+CMAKE_LISTS = """
+cmake_minimum_required(VERSION 3.24)
+project(player C)
+find_package(HalvoxClient 0.1 REQUIRED)
+add_executable(player player.c)
+target_link_libraries(player PRIVATE Halvox::client Halvox::trace)
+"""
+
+
+def run(*command, **options):
+    """Runs a program to its end and returns what it printed."""
+    result = subprocess.run([str(part) for part in command], stdout=subprocess.PIPE, stderr=subprocess.STDOUT,
+                            text=True, timeout=harness.DEADLINE, check=False, **options)
+    if result.returncode != 0:
+        raise AssertionError(f"{command} ended with {result.returncode}:\n{result.stdout}")
+    return result.stdout
+
+
+class Installation(unittest.TestCase):
+    @classmethod
+    def setUpClass(cls):
+        for tool in "cmake", "cc", "pkg-config":
+            harness.require(tool)
+        cls.directory = Path(tempfile.mkdtemp(prefix="halvox-test-"))
+        cls.addClassCleanup(shutil.rmtree, cls.directory, True)
+        cls.prefix = cls.directory / "usr"
+        run("cmake", "--install", BUILD, "--prefix", cls.prefix)
+        cls.libraries, = {path.parent for path in cls.prefix.glob("lib/**/libhalvox-client.so")}
+
+    def environment(self):
+        return {**os.environ, "PKG_CONFIG_PATH": str(self.libraries / "pkgconfig"),
+                "LD_LIBRARY_PATH": str(self.libraries)}
+
+
+class LibraryTest(Installation):
+    def setUp(self):
+        if os.environ.get("HALVOX_SANITIZE"):
+            self.skipTest("a sanitized library needs a sanitized program")
+        self.source = Path(tempfile.mkdtemp(dir=self.directory))
+        (self.source / "player.c").write_text(PROGRAM)
+
+    def check_reports(self, program):
+        with Service() as service:
+            answer = run(program, env={**self.environment(), "HALVOX_SOCKET": service.socket})
+
+            self.assertEqual(answer, "1\n")
+            payload = service.wait_for_payload(lambda found: "volume" in found)
+            self.assertEqual(payload["volume"], 0.5)
+
+    def test_a_program_outside_the_tree_builds_with_pkg_config_and_reports(self):
+        flags = run("pkg-config", "--cflags", "--libs", "halvox-client", env=self.environment()).split()
+        run("cc", "-Wall", "-Werror", "player.c", *flags, "-o", "player", cwd=self.source)
+
+        self.check_reports(self.source / "player")
+
+    def test_a_program_outside_the_tree_builds_with_find_package_and_reports(self):
+        (self.source / "CMakeLists.txt").write_text(CMAKE_LISTS)
+        run("cmake", "-B", "build", f"-DCMAKE_PREFIX_PATH={self.prefix}", cwd=self.source)
+        run("cmake", "--build", "build", cwd=self.source)
+
+        self.check_reports(self.source / "build/player")
+
+    def test_the_libraries_say_their_version(self):
+        for library in "halvox-client", "halvox-trace":
+            version = run("pkg-config", "--modversion", library, env=self.environment()).strip()
+            self.assertTrue((self.libraries / f"lib{library}.so.{version}").is_file(), version)
+
+
+class SystemFilesTest(Installation):
+    def test_units_and_bus_files_name_the_installed_programs(self):
+        commands = {}
+        for path in (*self.prefix.glob("lib/systemd/*/*.service"),
+                     *self.prefix.glob("share/dbus-1/system-services/*.service")):
+            for command in re.findall(r"^Exec(?:Start)?=(\S+)", path.read_text(), re.MULTILINE):
+                commands[path.name] = command
+
+        expected = {name for name in ("halvox-reportingd", "halvox-pipewire-reporter") if (BIN / name).exists()}
+        self.assertEqual(set(commands.values()), {str(self.prefix / "bin" / name) for name in expected})
+        for command in commands.values():
+            self.assertTrue(os.access(command, os.X_OK), command)
+
+    def test_each_file_is_where_its_reader_looks_for_it(self):
+        for path in ("lib/systemd/system/halvox-reportingd.service", "lib/systemd/system/halvox-reportingd.socket",
+                     "lib/sysusers.d/halvox.conf", "lib/tmpfiles.d/halvox.conf",
+                     "share/dbus-1/system.d/com.tarno.halvox.reporting.conf",
+                     "share/dbus-1/system-services/com.tarno.halvox.reporting.service",
+                     f"share/dbus-1/interfaces/{INTERFACE}.xml",
+                     "share/bash-completion/completions/halvoxctl", "share/man/man1/halvoxctl.1",
+                     "include/halvox.h", "include/halvox_trace.h"):
+            self.assertTrue((self.prefix / path).is_file(), path)
+
+    def test_systemd_accepts_the_units(self):
+        harness.require("systemd-analyze")
+        units = sorted((self.prefix / "lib/systemd").glob("*/halvox-*"))
+        self.assertGreaterEqual(len(units), 2)
+        for unit in units:
+            self.assertEqual(run("systemd-analyze", "verify", "--man=no", "--recursive-errors=no", unit), "")
+
+
+class InterfaceFileTest(Installation):
+    """The interface file, which has names and comments, and the service's own answer agree."""
+
+    def file(self):
+        return self.prefix / f"share/dbus-1/interfaces/{INTERFACE}.xml"
+
+    def methods(self, document):
+        interface, = [found for found in ElementTree.fromstring(document).iter("interface")
+                      if found.get("name") == INTERFACE]
+        return [(method.get("name"), [(argument.get("type"), argument.get("direction")) for argument in method])
+                for method in interface.iter("method")]
+
+    def test_the_methods_are_those_that_the_service_shows(self):
+        with Service() as service:
+            client = Client.to_socket(service.address)
+            self.addCleanup(client.close)
+            answer, = client.connection.call_sync(
+                None, OBJECT, "org.freedesktop.DBus.Introspectable", "Introspect", None, GLib.VariantType("(s)"),
+                0, int(harness.DEADLINE * 1000), None).unpack()
+
+        self.assertEqual(self.methods(self.file().read_text()), self.methods(answer))
+
+    def test_each_argument_has_a_name_and_a_description(self):
+        text = self.file().read_text()
+        for method in ElementTree.fromstring(text).iter("method"):
+            comment = re.search(rf"<!-- {method.get('name')}:(.*?)-->", text, re.DOTALL)
+            self.assertIsNotNone(comment, method.get("name"))
+            described = re.findall(r"@(\w+):", comment[1])
+            self.assertEqual(described, [argument.get("name") for argument in method])
+
+    def test_a_generator_makes_code_from_it(self):
+        harness.require("gdbus-codegen")
+        run("gdbus-codegen", "--interface-prefix", "com.tarno.halvox.", "--generate-c-code", "generated",
+            "--c-namespace", "Halvox", self.file(), cwd=self.directory)
+
+        header = (self.directory / "generated.h").read_text()
+        self.assertIn("create_reporting_session", header)
+
+
+if __name__ == "__main__":
+    unittest.main()
