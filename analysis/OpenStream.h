@@ -26,6 +26,8 @@ class OpenStream {
 
   [[nodiscard]] const StreamStory& story() const { return story_; }
   [[nodiscard]] bool runs() const { return isInRun_ || isPlaying_; }
+  // True if the client's last word on its volume was that it does not play.
+  [[nodiscard]] bool saysItPaused() const { return volume_.has_value() && !isPlaying_; }
   // True after a Start.
   [[nodiscard]] bool hasStarted() const { return hasStarted_; }
 

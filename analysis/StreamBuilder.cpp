@@ -10,6 +10,8 @@
 namespace halvox::analysis {
 namespace {
 
+using ServiceTimes = StreamBuilder::ServiceTimes;
+
 constexpr std::string_view kClientGoneEvent = "com.tarno.halvox.hvreportingclientuptime";
 constexpr std::string_view kSummaryKey = "HV_Session_Summary_Event";
 constexpr std::string_view kSerialKey = "object_serial";
@@ -26,11 +28,25 @@ bool isSummary(const Message& message, const Payload& payload) {
          payload.text(kSummaryKey).has_value();
 }
 
-// True for what the service itself sends at the end of a session. Such a message does not begin a
-// story.
+// True for what the service itself sends at the end of a session. It says nothing new of a stream.
+// Some of it has no stamp: its event and its link message cannot be brought together.
 bool isEndReport(const Message& message) {
   return message.category == "IOReporting" || message.type == "Summary" ||
          message.type == "Unknown";
+}
+
+bool isAnotherProcess(const ServiceTimes& last, const ServiceTimes& now) {
+  constexpr double kRounding = 1.1;  // of the difference of two rounded times
+  constexpr double kDisorder = 0.1;
+  constexpr double kNoticeable = 0.2;
+  constexpr double kDrift = 0.001;  // of a clock that is being corrected
+  const double startChange = now.start - last.start;
+  if (now.uptime < last.uptime - kDisorder || std::abs(startChange) > 2 * kRounding) return true;
+  const double passed = now.stamp - last.stamp;
+  const double wallChange = passed - (now.uptime - last.uptime);
+  // A clock that was set moves one of the two starts only.
+  return wallChange > kNoticeable + kDrift * std::abs(passed) &&
+         std::abs(wallChange - startChange) <= kRounding;
 }
 
 std::uint64_t programOf(std::string_view application, std::string_view service) {
@@ -66,35 +82,33 @@ void StreamBuilder::onMessage(const Message& message) {
     endSession(*stream, message);
     return;
   }
+  if (isEndReport(message)) return;
   streams_.splice(streams_.end(), streams_, stream->place);
   stream->add(message, payload_);
   noteProgram(*stream, message);
 }
 
-// The two uptimes of a message come from one clock. Apart from rounding to a second, their
-// difference is the same for all messages of one process.
+// Each message says when the service's process started: by the wall clock, which may be set, and by
+// the machine's uptime, which is rounded to seconds.
 void StreamBuilder::noticeRestart(const Message& message, double before) {
-  constexpr double kRounding = 2;
-  constexpr double kDisorder = 0.1;
   const auto system = payload_.number("systemuptime_sec");
   const auto process = payload_.number("processuptime_ms");
-  if (!system || !process || !message.isEvent) return;
+  const auto stamp = payload_.number("hvreporting_timestamp");
+  if (!system || !process || !stamp || !message.isEvent) return;
   const double uptime = *process / 1000;
-  const double start = *system - uptime;
-  if (serviceStart_ &&
-      (std::abs(start - *serviceStart_) > kRounding || uptime < serviceUptime_ - kDisorder)) {
-    // The store does not say when the service ended. It was still running at the record before.
-    closeAll(StreamEnd::kServiceGone, before);
-    serviceStart_.reset();
-  }
-  if (!serviceStart_) serviceStart_ = start;
-  serviceUptime_ = uptime;
+  const ServiceTimes times{.stamp = *stamp, .uptime = uptime, .start = *system - uptime};
+  const bool isRestart = service_.has_value() && isAnotherProcess(*service_, times);
+  service_ = times;
+  // The store does not say when the service ended. It was still running at the record before.
+  if (isRestart) closeAll(StreamEnd::kServiceGone, before);
 }
 
 OpenStream* StreamBuilder::streamOf(const Message& message) {
   if (message.sessionID == kNoSession) return nullptr;
+  const bool mayBegin = !isEndReport(message);
   if (const auto serial = payload_.integer(kSerialKey)) {
     if (OpenStream* const found = findBySerial(*serial, message)) return found;
+    if (!mayBegin) return nullptr;
     OpenStream& opened = open(message);
     opened.setSerial(*serial);
     bySerial_.emplace(*serial, &opened);
@@ -102,17 +116,15 @@ OpenStream* StreamBuilder::streamOf(const Message& message) {
   }
   if (message.sessionID) {
     const auto found = bySession_.find(*message.sessionID);
-    if (found == bySession_.end()) {
-      return isSummary(message, payload_) ? nullptr : &open(message);
-    }
-    if (!found->second->undecidedSince) return found->second;
+    if (found == bySession_.end()) return mayBegin ? &open(message) : nullptr;
+    if (!found->second->undecidedSince || !mayBegin) return found->second;
     // The session was started again.
     close(*found->second, StreamEnd::kStopped, *found->second->undecidedSince);
     return &open(message);
   }
   if (message.service == kStandalone) return nullptr;
   if (OpenStream* const found = findByProgram(message)) return found;
-  return isEndReport(message) ? nullptr : &open(message);
+  return mayBegin ? &open(message) : nullptr;
 }
 
 OpenStream* StreamBuilder::findBySerial(std::int64_t serial, const Message& message) {
@@ -151,7 +163,8 @@ OpenStream& StreamBuilder::open(const Message& message) {
 }
 
 void StreamBuilder::endSession(OpenStream& stream, const Message& message) {
-  if (!stream.runs()) {
+  if (stream.undecidedSince) return;
+  if (!stream.runs() || stream.saysItPaused()) {
     close(stream, StreamEnd::kStopped, message.time);
   } else if (lastClientGone_ && message.time - *lastClientGone_ <= kSameMoment) {
     close(stream, StreamEnd::kClientGone, message.time);

@@ -60,6 +60,14 @@ class StreamBuilder {
     bool serviceIsGone = false;
   };
 
+  // What a message says of the service's process: its time stamp, the process's uptime, and when it
+  // started by the machine's uptime, all in seconds.
+  struct ServiceTimes {
+    double stamp = 0;
+    double uptime = 0;
+    double start = 0;
+  };
+
   explicit StreamBuilder(StoryCallback onStory, MomentCallback onMoment = nullptr);
   StreamBuilder(const StreamBuilder&) = delete;
   StreamBuilder& operator=(const StreamBuilder&) = delete;
@@ -99,11 +107,8 @@ class StreamBuilder {
   std::unordered_map<std::int64_t, OpenStream*> bySession_;
   // The newest stream of an application and service type, by the hash of both.
   std::unordered_map<std::uint64_t, OpenStream*> byProgram_;
-  // The start of the service's process by the machine's uptime, and the process's last uptime, in
-  // seconds.
-  std::optional<double> serviceStart_;
-  double serviceUptime_ = 0;
-  double lastTime_ = 0;  // of the newest record
+  std::optional<ServiceTimes> service_;  // of the last message that has them
+  double lastTime_ = 0;                  // of the newest record
   std::optional<double> lastClientGone_;
 };
 
