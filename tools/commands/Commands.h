@@ -11,6 +11,7 @@ void addScriptRequests(CommandSet& commands);    // wait, sleep: only in scripts
 void addScriptCommands(CommandSet& commands);    // run, shell
 void addRecordCommands(CommandSet& commands);    // events, metrics, power, link
 void addQueryCommands(CommandSet& commands);     // sql, export
+void addStreamCommands(CommandSet& commands);    // streams
 void addSnapshotCommands(CommandSet& commands);  // snapshots
 void addSummaryCommand(CommandSet& commands);    // summary
 void addTraceCommands(CommandSet& commands);     // trace

@@ -1,0 +1,129 @@
+#include "tools/Streams.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include "tools/StoredEventsFixture.h"
+#include "tools/StreamText.h"
+
+namespace halvox::tools {
+namespace {
+
+using analysis::StreamEnd;
+using analysis::StreamMoment;
+using analysis::StreamStory;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::Not;
+
+class StreamsTest : public StoredEventsFixture {
+ protected:
+  void storeRun(const std::string& application, bool starts) {
+    const std::string name = starts ? "Start" : "Stop";
+    store("com.tarno.generic.Session_Playback." + name,
+          {{"run", 1}, {"object_serial", 44}, {"HostApplicationDisplayID", application}});
+  }
+  ExitStatus list(ShowStreams request, OutputForm form = OutputForm::kText) {
+    request.database = directory();
+    return showStreams(request, form, out_, -1, errors_);
+  }
+
+  std::ostringstream out_;
+  std::ostringstream errors_;
+};
+
+TEST_F(StreamsTest, ListsStreams) {
+  storeRun("player", true);
+  storeRun("player", false);
+
+  EXPECT_EQ(list({}), ExitStatus::kDone);
+  EXPECT_THAT(out_.str(), HasSubstr("player"));
+  EXPECT_THAT(out_.str(), HasSubstr("playback"));
+  EXPECT_THAT(out_.str(), HasSubstr("1.0s"));
+}
+
+TEST_F(StreamsTest, SelectsByApplication) {
+  storeRun("player", true);
+  storeRun("other", true);
+
+  EXPECT_EQ(list({.applications = {"o*"}}), ExitStatus::kDone);
+  EXPECT_THAT(out_.str(), HasSubstr("other"));
+  EXPECT_THAT(out_.str(), Not(HasSubstr("player")));
+}
+
+TEST_F(StreamsTest, ShowsTheMomentsOfOneStream) {
+  storeRun("player", true);
+  storeRun("player", false);
+  EXPECT_EQ(list({}, OutputForm::kJson), ExitStatus::kDone);
+  const std::string json = out_.str();
+  const std::int64_t id = std::stoll(json.substr(json.find(':') + 1));
+
+  out_.str("");
+  EXPECT_EQ(showStream({.id = id, .database = directory()}, OutputForm::kText, out_, errors_),
+            ExitStatus::kDone);
+  EXPECT_THAT(out_.str(), HasSubstr("It starts.\n"));
+  EXPECT_THAT(out_.str(), HasSubstr("It stops.\n"));
+}
+
+TEST_F(StreamsTest, AnUnknownStreamIsAnError) {
+  storeRun("player", true);
+
+  EXPECT_EQ(showStream({.id = 99, .database = directory()}, OutputForm::kJson, out_, errors_),
+            ExitStatus::kRefused);
+  EXPECT_THAT(out_.str(), HasSubstr("\"kind\":\"refused\""));
+  EXPECT_THAT(errors_.str(), HasSubstr("no stream or session has the ID 99"));
+}
+
+TEST(StreamTextTest, DurationsAreShort) {
+  EXPECT_EQ(durationText(4.56), "4.6s");
+  EXPECT_EQ(durationText(59.96), "1m00s");
+  EXPECT_EQ(durationText(754), "12m34s");
+  EXPECT_EQ(durationText(3723), "1h02m03s");
+  EXPECT_EQ(durationText(-1), "0.0s");
+}
+
+TEST(StreamTextTest, ARowHasChangesInOrder) {
+  StreamStory story;
+  story.id = 7;
+  story.application = "a\x1b[31m";
+  story.ranSeconds = 6;
+  story.volumes = {{.volume = 0.8, .seconds = 2}, {.volume = 0, .seconds = 3}};
+  story.routes = {{.time = 1, .text = "A", .names = "a"},
+                  {.time = 2, .text = "A", .names = "b"},
+                  {.time = 3, .text = "B", .names = "c"}};
+  story.routesNotKept = 4;
+  story.xruns = {.reports = 2, .milliseconds = 469.3};
+  story.end = StreamEnd::kClientGone;
+
+  const std::vector<std::string> row = streamRow(story);
+  EXPECT_EQ(row.size(), streamColumns().size());
+  EXPECT_EQ(row[2], "a\\u001b[31m");
+  EXPECT_EQ(row[5], "A → B → 4 more");
+  EXPECT_EQ(row[7], "0.80 2.0s, muted 3.0s, unknown 1.0s");
+  EXPECT_EQ(row[8], "-");
+  EXPECT_EQ(row[9], "2 (469 ms)");
+  EXPECT_EQ(row[10], "client gone");
+}
+
+TEST(StreamTextTest, SaysWhoWasLate) {
+  StreamMoment moment;
+  moment.kind = StreamMoment::Kind::kXrun;
+  moment.xrun = {.milliseconds = 21.3,
+                 .missedCycles = 1,
+                 .quantum = 1024,
+                 .rate = 48000,
+                 .role = "victim",
+                 .device = "hw0",
+                 .lateNode = "browser",
+                 .lateProcess = "web",
+                 .lateObjectSerial = 9};
+
+  EXPECT_EQ(describeMoment({}, moment),
+            "It lost 21 ms in 1 cycle on hw0 (quantum 1024 at 48000 Hz): browser was late, of "
+            "process web.");
+  moment.xrun.role = "culprit";
+  EXPECT_THAT(describeMoment({}, moment), HasSubstr(": this stream was late."));
+}
+
+}  // namespace
+}  // namespace halvox::tools
