@@ -43,10 +43,15 @@ class StreamWatcherTest : public PipeWireFixture {
     watcher.reset();
     watcher = std::make_unique<StreamWatcher>(loop->handle(), tracker, std::move(options));
   }
+  // Runs the loop until something happens, at most this long. Returns how many events it handled.
+  // A function, because clang warns of the library's macro inside of the macros of the tests.
+  int iterate(std::chrono::milliseconds time) const {
+    return pw_loop_iterate(loop->handle(), static_cast<int>(time.count()));
+  }
   void iterateFor(std::chrono::seconds time) const {
     const auto end = steady_clock::now() + time;
     while (steady_clock::now() < end) {
-      pw_loop_iterate(loop->handle(), 100);
+      iterate(std::chrono::milliseconds(100));
     }
   }
   // Runs the loop until the operation was recorded `count` times, at most until the deadline.
@@ -55,7 +60,7 @@ class StreamWatcherTest : public PipeWireFixture {
   }
   [[nodiscard]] bool waitUntil(const std::function<bool()>& condition) const {
     return platform::linux_::eventually(condition,
-                                        [this] { pw_loop_iterate(loop->handle(), 100); });
+                                        [this] { iterate(std::chrono::milliseconds(100)); });
   }
   [[nodiscard]] PipedProcess play(double seconds, const std::string& role = "Music") const {
     return PipedProcess(
@@ -119,6 +124,20 @@ TEST_F(StreamWatcherTest, ReportsTheSerialOfTheStreamInItsIdentifier) {
 
   EXPECT_GT(serial, 0U);
   EXPECT_EQ(static_cast<std::uint64_t>(client.calls().front().id) & 0xFFFFFFFFU, serial);
+}
+
+TEST_F(StreamWatcherTest, AStreamCannotClaimToBeInASandbox) {
+  const PipedProcess player({"pw-play", "-P",
+                             "{ application.desktop=\"player.desktop\" "
+                             "pipewire.access.portal.app_id=\"org.example.Claimed\" }",
+                             audio->makeTone(20)});
+
+  ASSERT_TRUE(waitFor("playback-start"));
+
+  const auto configuration = client.last("configure");
+  EXPECT_EQ(configuration.find("desktop_entry")->string(), "player.desktop");
+  EXPECT_FALSE(configuration.contains("portal_app_id"));
+  EXPECT_EQ(configuration.find(kApplicationKey)->string(), "pw-play");
 }
 
 TEST_F(StreamWatcherTest, EndsSessionsWhenPipeWireEndsAndFollowsItAfterItsRestart) {
@@ -186,11 +205,10 @@ TEST_F(StreamWatcherTest, SleepsWithoutStreamsEvenWithAProfiler) {
     ASSERT_TRUE(waitFor("volume"));
   }
   ASSERT_TRUE(waitFor("destroy"));
-  while (pw_loop_iterate(loop->handle(), 500) > 0) {
+  while (iterate(std::chrono::milliseconds(500)) > 0) {
   }
 
-  constexpr int kSeconds = 2;
-  EXPECT_EQ(pw_loop_iterate(loop->handle(), kSeconds * 1000), 0);
+  EXPECT_EQ(iterate(std::chrono::seconds(2)), 0);
 }
 
 TEST_F(StreamWatcherTest, SleepsWhileNothingChangesWithoutXruns) {
@@ -199,13 +217,10 @@ TEST_F(StreamWatcherTest, SleepsWhileNothingChangesWithoutXruns) {
   const PipedProcess player = play(20);
   ASSERT_TRUE(waitFor("volume"));
   // Let the last events of the start arrive.
-  while (pw_loop_iterate(loop->handle(), 500) > 0) {
+  while (iterate(std::chrono::milliseconds(500)) > 0) {
   }
 
-  constexpr int kSeconds = 2;
-  const int woken = pw_loop_iterate(loop->handle(), kSeconds * 1000);
-
-  EXPECT_EQ(woken, 0);
+  EXPECT_EQ(iterate(std::chrono::seconds(2)), 0);
 }
 
 TEST_F(StreamWatcherTest, WaitsForAMissingPipeWire) {
@@ -214,7 +229,7 @@ TEST_F(StreamWatcherTest, WaitsForAMissingPipeWire) {
 
   follow({.remote = "nobody-home", .log = {}});
   for (int i = 0; i < 3; ++i) {
-    pw_loop_iterate(loop->handle(), 500);
+    iterate(std::chrono::milliseconds(500));
   }
 
   EXPECT_THAT(log, testing::ElementsAre(testing::StartsWith("waiting for PipeWire")));

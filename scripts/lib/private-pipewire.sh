@@ -13,7 +13,7 @@
 #   halvox_audio_start DIRECTORY      # starts and waits; exports what clients need
 #   halvox_audio_stop
 #
-# HALVOX_AUDIO_SINK names another factory for the sink. SPA_PLUGIN_DIR says where PipeWire looks for it.
+# HALVOX_AUDIO_SINK names another factory for the sink, which PipeWire finds in SPA_PLUGIN_DIR.
 #
 # DIRECTORY must exist, and must be short: a socket's path has at most 107 bytes.
 

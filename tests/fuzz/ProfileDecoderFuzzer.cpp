@@ -9,6 +9,7 @@
 #include <spa/pod/pod.h>
 
 #include "platform/linux/drivers/pipewire/GraphStatistics.h"
+#include "platform/linux/pipewire/MissedCycles.h"
 #include "platform/linux/pipewire/ProfileDecoder.h"
 
 namespace {
@@ -21,7 +22,13 @@ void count(const std::vector<pipewire::ProfiledCycle>& cycles) {
   platform::linux_::GraphStatistics graph;
   graph.nodeAdded(kDriver, "Audio/Sink", "speakers");
   graph.nodeAdded(kFollower, "Audio/Source", "microphone");
-  for (const auto& cycle : cycles) graph.cycleEnded(cycle);
+  pipewire::MissedCycles missed;
+  for (const auto& cycle : cycles) {
+    graph.cycleEnded(cycle);
+    // Only followers that were late can be at fault.
+    const auto loss = missed.add(cycle);
+    if (loss.fault == pipewire::CycleFault::kFollowers && cycle.late.empty()) std::abort();
+  }
   platform::linux_::ReadingMaker maker;
   graph.addTo(maker, {});
   static_cast<void>(maker.finish());
