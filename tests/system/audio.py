@@ -117,6 +117,10 @@ class Player:
         self._process.stdin.write(f"stall {int(seconds * 1000)}\n")
         self._process.stdin.flush()
 
+    def kill(self):
+        self._process.kill()
+        self._process.wait(30)
+
     def stop(self):
         """Does nothing if it has been stopped."""
         self._process.stdin.close()
