@@ -1,12 +1,14 @@
 // Plays an audio program in the tests of missed cycles, and reads PipeWire's profiler without the
 // code that these tests examine.
 //
-//   halvox_audio_client play NAME FRAMES   plays silence in cycles of FRAMES frames; prints
-//   "running"
-//                                          when it is first called. For each line "stall MS" of
-//                                          standard input it sleeps in its next cycle, once.
-//   halvox_audio_client profile            prints a line of JSON for each cycle that the profiler
-//                                          reports. A cycle that is reported twice has two lines.
+//   halvox_audio_client play NAME FRAMES [SANDBOX]
+//     Plays silence in cycles of FRAMES frames. Prints "running" when it is first called. For each
+//     line "stall MS" of standard input it sleeps in its next cycle, once. SANDBOX is the ID of a
+//     sandboxed application, which it sets on its client as the desktop portal does.
+//
+//   halvox_audio_client profile
+//     Prints a line of JSON for each cycle that the profiler reports. A cycle that is reported
+//     twice has two lines.
 //
 // Both end with their standard input.
 
@@ -79,7 +81,7 @@ void onProcess(void* data) {
   pw_stream_queue_buffer(player->stream, buffer);
 }
 
-int play(const std::string& name, const std::string& frames) {
+int play(const std::string& name, const std::string& frames, const char* sandbox) {
   static const pw_stream_events kEvents = [] {
     pw_stream_events events{};
     events.version = PW_VERSION_STREAM_EVENTS;
@@ -91,8 +93,17 @@ int play(const std::string& name, const std::string& frames) {
   pw_properties* properties = pw_properties_new(
       PW_KEY_MEDIA_TYPE, "Audio", PW_KEY_MEDIA_CATEGORY, "Playback", PW_KEY_MEDIA_ROLE, "Music",
       PW_KEY_NODE_NAME, name.c_str(), PW_KEY_NODE_FORCE_QUANTUM, frames.c_str(), nullptr);
-  player.stream = pw_stream_new_simple(pw_main_loop_get_loop(loop), name.c_str(), properties,
-                                       &kEvents, &player);
+  pw_context* context = pw_context_new(pw_main_loop_get_loop(loop), nullptr, 0);
+  pw_properties* client = pw_properties_new(PW_KEY_APP_NAME, name.c_str(), nullptr);
+  if (sandbox != nullptr) pw_properties_set(client, "pipewire.access.portal.app_id", sandbox);
+  pw_core* core = pw_context_connect(context, client, 0);
+  if (core == nullptr) {
+    std::cerr << "cannot connect to PipeWire\n";
+    return EXIT_FAILURE;
+  }
+  spa_hook hook{};
+  player.stream = pw_stream_new(core, name.c_str(), properties);
+  pw_stream_add_listener(player.stream, &hook, &kEvents, &player);
   std::uint8_t buffer[1024];
   spa_pod_builder builder{};
   spa_pod_builder_init(&builder, buffer, sizeof buffer);
@@ -112,6 +123,8 @@ int play(const std::string& name, const std::string& frames) {
     if (line.starts_with(kStall)) player.stall = std::stoi(line.substr(kStall.size()));
   });
   pw_stream_destroy(player.stream);
+  pw_core_disconnect(core);
+  pw_context_destroy(context);
   pw_main_loop_destroy(loop);
   return EXIT_SUCCESS;
 }
@@ -221,8 +234,10 @@ int profile() {
 int main(int count, char** arguments) {
   const std::string_view command = count > 1 ? arguments[1] : "";
   pw_init(nullptr, nullptr);
-  if (command == "play" && count == 4) return play(arguments[2], arguments[3]);
+  if (command == "play" && (count == 4 || count == 5)) {
+    return play(arguments[2], arguments[3], count == 5 ? arguments[4] : nullptr);
+  }
   if (command == "profile" && count == 2) return profile();
-  std::cerr << "usage: halvox_audio_client play NAME FRAMES | profile\n";
+  std::cerr << "usage: halvox_audio_client play NAME FRAMES [SANDBOX] | profile\n";
   return EXIT_FAILURE;
 }

@@ -102,10 +102,10 @@ class Audio:
 class Player:
     """A program that plays silence in cycles of that many frames, and can be made to stall."""
 
-    def __init__(self, audio, name, frames):
+    def __init__(self, audio, name, frames, *sandbox):
         self.name = name
         self._process = subprocess.Popen(
-            [AUDIO_CLIENT, "play", name, str(frames)], env=audio.environment,
+            [AUDIO_CLIENT, "play", name, str(frames), *sandbox], env=audio.environment,
             stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True)
         line = self._process.stdout.readline().strip()
         if line != "running":

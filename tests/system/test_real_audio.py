@@ -62,6 +62,15 @@ class RealAudioTest(unittest.TestCase):
         route = message(self.service.events(), "RouteChange.State")[0]
         self.assertEqual(route["active_devices"], "Demo speakers")
 
+    def test_a_sandboxed_application_is_recorded_under_the_id_of_its_sandbox(self):
+        player = audio.Player(self.audio, "anything", 1024, "org.example.Sandboxed")
+        self.stack.callback(player.stop)
+
+        start = self.wait_for_message("Session_Playback.Start")[0]
+
+        self.assertEqual(start["HostApplicationDisplayID"], "org.example.Sandboxed")
+        self.assertIn("portal_app_id = org.example.Sandboxed;", self.reporter.log())
+
     def test_capture_is_recorded(self):
         recorder = self.audio.run("pw-record", "--media-role", "Communication", "-P",
                                   "{ stream.capture.sink=true }", self.audio.directory / "out.wav")
