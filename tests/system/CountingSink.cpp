@@ -7,6 +7,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
 
 #include <dlfcn.h>
@@ -14,6 +15,7 @@
 #include <spa/node/utils.h>
 #include <spa/support/plugin.h>
 #include <spa/utils/names.h>
+#include <unistd.h>
 
 namespace {
 
@@ -26,8 +28,14 @@ spa_callbacks listener{};    // what PipeWire wants to be called
 // Whether the sink got its samples since the last cycle began.
 bool wasProcessed = true;
 
+// Whether a test wants the device itself to be late. It then makes the file, once for each xrun.
+bool isXrunWanted() {
+  static const char* const file = std::getenv("HALVOX_AUDIO_XRUN");
+  return file != nullptr && unlink(file) == 0;
+}
+
 int onReady(void* /*data*/, int status) {
-  if (!wasProcessed) spa_node_call_xrun(&listener, 0, 0, nullptr);
+  if (!wasProcessed || isXrunWanted()) spa_node_call_xrun(&listener, 0, 0, nullptr);
   const int result = spa_node_call_ready(&listener, status);
   // Cleared after the call, in which PipeWire processes what an unfinished cycle has.
   wasProcessed = false;

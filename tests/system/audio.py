@@ -39,13 +39,15 @@ class Audio:
     without a reserve has. The usual sink has no hardware and counts none."""
 
     def __init__(self, counts_xruns=False):
-        self._variables = {"HALVOX_AUDIO_SINK": "halvox.counting-sink",
-                           "SPA_PLUGIN_DIR": f"{plugin_directory()}:{BIN}"} if counts_xruns else {}
+        self._counts_xruns = counts_xruns
 
     def __enter__(self):
         self.directory = Path(tempfile.mkdtemp(prefix="halvox-audio-"))
+        variables = {"HALVOX_AUDIO_SINK": "halvox.counting-sink",
+                     "HALVOX_AUDIO_XRUN": str(self.directory / "xrun"),
+                     "SPA_PLUGIN_DIR": f"{plugin_directory()}:{BIN}"} if self._counts_xruns else {}
         self._server = subprocess.Popen(
-            [PRIVATE_PIPEWIRE, "serve", self.directory], env={**os.environ, **self._variables},
+            [PRIVATE_PIPEWIRE, "serve", self.directory], env={**os.environ, **variables},
             stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True)
         try:
             self._expect("ready")
@@ -63,6 +65,12 @@ class Audio:
         stop_process(self._server)
         self._server.stdout.close()
         shutil.rmtree(self.directory, ignore_errors=True)
+
+    def cause_xrun(self):
+        """Lets the sink, which must count xruns, have one although all nodes are in time."""
+        file = self.directory / "xrun"
+        file.touch()
+        wait_for("the sink's xrun", lambda: not file.exists())
 
     def restart(self):
         self._server.stdin.write("restart\n")

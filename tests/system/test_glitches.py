@@ -138,6 +138,21 @@ class GlitchTest(unittest.TestCase):
             for counters in self.messages(f"IOReporting.{kind}"):
                 self.assertNotIn("", counters.values(), kind)
 
+    def test_an_xrun_of_the_device_is_shared_by_all_streams_that_ran_on_it(self):
+        self.run_streams(counts_xruns=True)
+        before, xruns = self.reports(), self.profile.cycles()[-1][1]
+
+        self.audio.cause_xrun()
+        self.wait_until_settled(time.monotonic())
+
+        counted = self.profile.cycles()[-1][1] - xruns
+        self.assertGreater(counted, 0)
+        for name, own in self.reports_since(before).items():
+            self.assertEqual(sum(report["missed_cycles"] for report in own), counted, name)
+            # A busy machine may make a player late as well.
+            self.assertIn(("device", "demo-speakers"),
+                          [(report["xrun_role"], report["late_node"]) for report in own])
+
     def test_a_culprit_that_is_killed_while_it_stalls_is_still_named(self):
         self.run_streams(counts_xruns=False)
         before, since = self.reports(), time.monotonic()
