@@ -172,21 +172,6 @@ void Value::setNumber(NumberKind kind, double number) noexcept {
   setNumber(kind, bits);
 }
 
-// Relies on the order of the tags.
-ValueKind Value::kind() const {
-  const Tag current = tag();
-  if (current == Tag::kNone) return ValueKind::kNone;
-  if (current <= Tag::kLastNumber) return ValueKind::kNumber;
-  if (current == Tag::kDate) return ValueKind::kDate;
-  if (current <= Tag::kSharedString) return ValueKind::kString;
-  if (current == Tag::kData) return ValueKind::kData;
-  return current == Tag::kArray ? ValueKind::kArray : ValueKind::kDictionary;
-}
-
-NumberKind Value::numberKind() const {
-  return static_cast<NumberKind>(storage_[0] - static_cast<unsigned char>(Tag::kFirstNumber));
-}
-
 std::int64_t Value::toInt64() const {
   if (!isNumber()) return 0;
   const NumberKind kind = numberKind();

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <algorithm>
 #include <atomic>
 #include <concepts>
 #include <cstddef>
@@ -221,14 +222,25 @@ class Value {
     if (isCounted()) release();
   }
 
-  [[nodiscard]] ValueKind kind() const;
+  // Relies on the order of the tags. Inline because encoders call it for each value.
+  [[nodiscard]] ValueKind kind() const {
+    const Tag current = tag();
+    if (current == Tag::kNone) return ValueKind::kNone;
+    if (current <= Tag::kLastNumber) return ValueKind::kNumber;
+    if (current == Tag::kDate) return ValueKind::kDate;
+    if (current <= Tag::kSharedString) return ValueKind::kString;
+    if (current == Tag::kData) return ValueKind::kData;
+    return current == Tag::kArray ? ValueKind::kArray : ValueKind::kDictionary;
+  }
   [[nodiscard]] bool isNumber() const { return kind() == ValueKind::kNumber; }
   [[nodiscard]] bool isString() const { return kind() == ValueKind::kString; }
   [[nodiscard]] bool isArray() const { return kind() == ValueKind::kArray; }
   [[nodiscard]] bool isDictionary() const { return kind() == ValueKind::kDictionary; }
 
   // Only for numbers.
-  [[nodiscard]] NumberKind numberKind() const;
+  [[nodiscard]] NumberKind numberKind() const {
+    return static_cast<NumberKind>(storage_[0] - static_cast<unsigned char>(Tag::kFirstNumber));
+  }
   // The number converted to the type: a fraction is cut off, a number outside the type's range
   // becomes the nearest end of the range, and a NaN becomes 0 as an integer. As a bool every number
   // but 0 is true. Anything that is not a number gives 0.
@@ -386,6 +398,11 @@ class Dictionary {
 
   [[nodiscard]] bool isIdenticalTo(const Dictionary& other) const {
     return rep_ == other.rep_ && size() == other.size();
+  }
+  // Returns how many entries at the beginning the two dictionaries share. Entries that are only
+  // equal do not count. Takes constant time.
+  [[nodiscard]] std::size_t sharedEntries(const Dictionary& other) const {
+    return rep_ == other.rep_ ? std::min(size(), other.size()) : 0;
   }
   // Bytes on the heap that this dictionary keeps in memory, including shared ones.
   [[nodiscard]] std::size_t memorySize() const;

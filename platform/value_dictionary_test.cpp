@@ -418,5 +418,24 @@ TEST(DictionaryTest, ATenFieldMessageWithStampsAndTagTakesFourHundredBytes) {
   EXPECT_LE(tagged.memorySize(), 400U);
 }
 
+TEST(DictionaryTest, SharedEntriesAreThoseThatBothHaveInOneBlock) {
+  Dictionary message;
+  message.reserve(4);
+  message.set("a", 1);
+  message.set("b", 2);
+  Dictionary tagged = message;
+  tagged.set("c", 3);
+  const Dictionary equal{{"a", 1}, {"b", 2}};
+  Dictionary changed = message;
+  changed.set("a", 5);
+
+  EXPECT_EQ(message.sharedEntries(tagged), 2U);
+  EXPECT_EQ(tagged.sharedEntries(message), 2U);
+  EXPECT_EQ(message.sharedEntries(message), 2U);
+  EXPECT_EQ(message.sharedEntries(equal), 0U);
+  EXPECT_EQ(message.sharedEntries(changed), 0U);
+  EXPECT_EQ(Dictionary().sharedEntries(Dictionary()), 0U);
+}
+
 }  // namespace
 }  // namespace halvox::platform
