@@ -13,6 +13,7 @@
 
 namespace halvox {
 
+using platform::AnalyticsPayload;
 using platform::Dictionary;
 using platform::Key;
 using platform::Message;
@@ -37,14 +38,16 @@ class EventName {
   std::size_t length_ = 0;
 };
 
-Dictionary makePayload(const Message& message, const HVReportingSession& session) {
+AnalyticsPayload makePayload(const Message& message, const HVReportingSession& session) {
   static const Key key("HostApplicationDisplayID");
   // A copy that shares the message's entries until it is changed, because every bridge and session
   // has the same message.
   Dictionary payload = message.value_or(Dictionary{});
+  platform::Value name = HVReportingUtilityRetrieveAppName(session.configuration());
+  if (payload.find(key) == nullptr) return {std::move(payload), {key, std::move(name)}};
   // Replaces what the message itself has under this key, because only the session's configuration
   // counts. This is required.
-  payload.set(key, HVReportingUtilityRetrieveAppName(session.configuration()));
+  payload.set(key, std::move(name));
   return payload;
 }
 
@@ -52,7 +55,7 @@ void sendIfUsed(std::string_view name, const Message& message,
                 const std::shared_ptr<HVReportingSession>& session) {
   platform::AnalyticsService& analytics = platform::analytics();
   if (!analytics.isAnalyticsEventUsed(name)) return;
-  analytics.sendAnalyticsEventLazy(std::string(name),
+  analytics.sendAnalyticsEventLazy(name,
                                    [message, session] { return makePayload(message, *session); });
 }
 

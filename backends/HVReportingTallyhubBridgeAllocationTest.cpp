@@ -20,7 +20,7 @@ class UnusedAnalyticsService final : public platform::AnalyticsService {
     ++asked;
     return false;
   }
-  void sendAnalyticsEventLazy(std::string /*eventName*/,
+  void sendAnalyticsEventLazy(std::string_view /*eventName*/,
                               platform::AnalyticsPayloadBuilder /*builder*/) override {
     ++sent;
   }

@@ -33,7 +33,7 @@ namespace halvox::bench {
 class NullAnalytics final : public platform::AnalyticsService {
  public:
   bool isAnalyticsEventUsed(std::string_view /*eventName*/) override { return false; }
-  void sendAnalyticsEventLazy(std::string /*name*/,
+  void sendAnalyticsEventLazy(std::string_view /*name*/,
                               platform::AnalyticsPayloadBuilder /*builder*/) override {}
 };
 

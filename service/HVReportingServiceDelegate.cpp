@@ -48,7 +48,7 @@ platform::Value clientUptime(const std::optional<platform::Date>& start, platfor
 }
 
 void sendUptimeEvent(const std::string& processName, const platform::Value& uptime) {
-  platform::analytics().sendAnalyticsEventLazy(std::string(kUptimeEvent), [processName, uptime] {
+  platform::analytics().sendAnalyticsEventLazy(kUptimeEvent, [processName, uptime] {
     return platform::Dictionary{{"processName", processName}, {"seconds", uptime}};
   });
 }

@@ -29,7 +29,8 @@ void FakeAnalyticsService::buildPayloads() const {
       builder = std::exchange(records_[index].builder, nullptr);
     }
     if (!builder) continue;
-    Dictionary payload = builder();  // without the lock: a builder may call this service
+    Dictionary payload =
+        builder().dictionary();  // without the lock: a builder may call this service
     const std::lock_guard lock(mutex_);
     if (index < records_.size()) records_[index].event.payload = std::move(payload);
   }
@@ -75,13 +76,13 @@ bool FakeAnalyticsService::isAnalyticsEventUsed(std::string_view eventName) {
   return !wanted_.has_value() || wanted_->contains(eventName);
 }
 
-void FakeAnalyticsService::sendAnalyticsEventLazy(std::string eventName,
+void FakeAnalyticsService::sendAnalyticsEventLazy(std::string_view eventName,
                                                   AnalyticsPayloadBuilder builder) {
   journal_.record(JournalKind::kAnalyticsEvent, eventName);
   bool buildsNow = false;
   {
     const std::lock_guard lock(mutex_);
-    records_.push_back({{std::move(eventName), std::nullopt}, std::move(builder)});
+    records_.push_back({{std::string(eventName), std::nullopt}, std::move(builder)});
     buildsNow = building_ == Building::kWhenSent;
   }
   if (buildsNow) std::thread([this] { buildPayloads(); }).join();

@@ -49,7 +49,7 @@ class FakeAnalyticsService final : public AnalyticsService {
   [[nodiscard]] std::vector<std::string> testedNames() const;
 
   [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override;
-  void sendAnalyticsEventLazy(std::string eventName, AnalyticsPayloadBuilder builder) override;
+  void sendAnalyticsEventLazy(std::string_view eventName, AnalyticsPayloadBuilder builder) override;
 
  private:
   struct Record {

@@ -74,40 +74,31 @@ SqliteCode MessageRecords::writeNext(TransactionAllowance& allowance) {
   --allowance.records;
   auto* const event = std::get_if<Event>(&record);
   auto* const link = std::get_if<LinkMessageRecord>(&record);
-  Dictionary payload;
+  AnalyticsPayload payload;
   if (link != nullptr) {
     payload = std::move(link->payload);
   } else if (event->builder) {
     payload = event->builder();
   }
-  const std::string_view text = encode(std::move(payload));
+  const std::string_view text = encoder_.encode(payload.entries(), payload.added());
+  // Count the payload of the two events of a message once, because they share its memory.
+  if (!encoder_.isRepeated()) writtenBytes_ += text.size();
   if (text.size() > longestPayload_) {
     ++port.tooLarge;
     return SQLITE_OK;
   }
-  static const Key applicationKey("HostApplicationDisplayID");
-  const Value* const application = lastPayload_.find(applicationKey);
   const std::uint64_t before = blocks_.bytes();
-  const SqliteCode code =
-      link != nullptr
-          ? blocks_.addLink(link->time, {*link->party, link->category, link->type}, text)
-          : blocks_.addEvent(event->time,
-                             {.name = event->name->text,
-                              .application = application == nullptr ? std::string_view()
-                                                                    : application->string()},
-                             text);
+  SqliteCode code = SQLITE_OK;
+  if (link != nullptr) {
+    code = blocks_.addLink(link->time, {*link->party, link->category, link->type}, text);
+  } else {
+    static const Key applicationKey("HostApplicationDisplayID");
+    const Value* const application = payload.find(applicationKey);
+    const std::string_view name = application == nullptr ? "" : application->string();
+    code = blocks_.addEvent(event->time, {.name = event->name->text, .application = name}, text);
+  }
   allowance.payloadBytes -= static_cast<std::int64_t>(blocks_.bytes() - before);
   return code;
-}
-
-// The two events of a message have equal payloads. Encodes the payload only for the first of them.
-std::string_view MessageRecords::encode(Dictionary payload) {
-  if (lastText_.empty() || !encodeAlike(payload, lastPayload_)) {
-    lastText_ = encoder_.encode(payload);
-    writtenBytes_ += lastText_.size();
-    lastPayload_ = std::move(payload);
-  }
-  return lastText_;
 }
 
 void MessageRecords::onCommitted(FinishedRecords& finished) {
@@ -119,8 +110,6 @@ void MessageRecords::onCommitted(FinishedRecords& finished) {
 }
 
 void MessageRecords::endTransaction(FinishedRecords& finished) {
-  lastText_ = {};
-  lastPayload_ = {};
   // Free the memory of a long text, because the next record may come only after hours. The summary
   // of a long session has many megabytes.
   encoder_.giveBack();

@@ -84,8 +84,6 @@ class MessageRecords final : public RecordKind {
     return std::holds_alternative<Event>(record) ? events_ : links_;
   }
   [[nodiscard]] SqliteCode writeNext(TransactionAllowance& allowance);
-  // Returns the JSON text, valid until the next call or the end of the transaction.
-  [[nodiscard]] std::string_view encode(Dictionary payload);
   void endTransaction(FinishedRecords& finished);
 
   EventNames& names_;
@@ -101,8 +99,6 @@ class MessageRecords final : public RecordKind {
   std::vector<Record> taken_;
   std::size_t next_ = 0;
   PayloadEncoder encoder_;
-  Dictionary lastPayload_;     // what lastText_ encodes
-  std::string_view lastText_;  // in encoder_
   MessageBlocks blocks_;
   std::uint64_t writtenBytes_ = 0;  // the length of the payloads of the open transaction
   OncePerSecond tooLargeLines_;

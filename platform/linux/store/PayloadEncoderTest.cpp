@@ -148,6 +148,128 @@ TEST(PayloadEncoderTest, EncodesDeepNesting) {
   EXPECT_TRUE(parses(encodeOne(value)));
 }
 
+// --- Payloads that resemble the one before ------------------------------------------------------
+
+// Encodes the payloads one after the other, and each with an encoder of its own.
+void expectTextsOfTheirOwn(std::span<const Dictionary> payloads) {
+  PayloadEncoder encoder;
+  for (const Dictionary& payload : payloads) {
+    EXPECT_EQ(encoder.encode(payload), PayloadEncoder().encode(payload));
+  }
+}
+
+TEST(PayloadEncoderTest, AddsAnEntryAfterTheOthers) {
+  PayloadEncoder encoder;
+  const Dictionary::Entry added{"z", "end"};
+  EXPECT_EQ(encoder.encode(Dictionary{{"a", 1}}, &added), R"({"a":1,"z":"end"})");
+  EXPECT_EQ(encoder.encode(Dictionary{}, &added), R"({"z":"end"})");
+  EXPECT_EQ(encoder.encode(Dictionary{}), "{}");
+}
+
+TEST(PayloadEncoderTest, TwinsHaveOneText) {
+  PayloadEncoder encoder;
+  const Dictionary message{{"a", 1}, {"b", "text"}};
+  const Dictionary::Entry added{"z", "end"};
+  const std::string first(encoder.encode(message, &added));
+  EXPECT_FALSE(encoder.isRepeated());
+
+  EXPECT_EQ(encoder.encode(message, &added), first);
+
+  EXPECT_TRUE(encoder.isRepeated());
+}
+
+TEST(PayloadEncoderTest, PayloadWithAnotherEndIsNoTwin) {
+  PayloadEncoder encoder;
+  const Dictionary message{{"a", 1}};
+  const Dictionary::Entry one{"z", 1};
+  const Dictionary::Entry yes{"z", true};
+  const Dictionary::Entry other{"y", 1};
+  EXPECT_EQ(encoder.encode(message, &one), R"({"a":1,"z":1})");
+  EXPECT_EQ(encoder.encode(message, &yes), R"({"a":1,"z":true})");
+  EXPECT_EQ(encoder.encode(message, &other), R"({"a":1,"y":1})");
+  EXPECT_EQ(encoder.encode(message), R"({"a":1})");
+  EXPECT_EQ(encoder.encode(message, &one), R"({"a":1,"z":1})");
+  EXPECT_FALSE(encoder.isRepeated());
+}
+
+TEST(PayloadEncoderTest, LinkMessageWithOneMoreEntrySharesTheTextOfItsEvent) {
+  Dictionary message;
+  message.reserve(3);
+  message.set("a", 1);
+  message.set("b", "text");
+  Dictionary tagged = message;
+  tagged.set("audiotag", "Start");
+  ASSERT_EQ(tagged.sharedEntries(message), 2U);
+  const Dictionary::Entry name{"name", "app"};
+  PayloadEncoder encoder;
+  for (int round = 0; round < 3; ++round) {
+    EXPECT_EQ(encoder.encode(message, &name), R"({"a":1,"b":"text","name":"app"})");
+    EXPECT_EQ(encoder.encode(tagged), R"({"a":1,"b":"text","audiotag":"Start"})");
+    EXPECT_EQ(encoder.encode(tagged, &name),
+              R"({"a":1,"b":"text","audiotag":"Start","name":"app"})");
+  }
+}
+
+TEST(PayloadEncoderTest, NextPayloadWithOtherValuesHasTextOfItsOwn) {
+  const std::string longText(100, 'x');
+  expectTextsOfTheirOwn(std::array<Dictionary, 6>{{
+      {{"a", 1}, {"b", longText}, {"c", 2.5}},
+      {{"a", 100}, {"b", longText}, {"c", 2.5}},
+      {{"a", 1}, {"b", longText + "y"}, {"c", -0.0}},
+      {{"a", true}, {"b", "\n"}, {"c", 0.0}},
+      {{"a", Value()}, {"b", "\n"}, {"c", Array{1, "two"}}},
+      {{"a", Value()}, {"b", Dictionary{{"b", 1}}}, {"c", Array{true, "two"}}},
+  }});
+}
+
+TEST(PayloadEncoderTest, NextPayloadWithOtherKeysHasTextOfItsOwn) {
+  const std::string rareKey(1000, 'k');  // too long to be interned
+  expectTextsOfTheirOwn(std::array<Dictionary, 10>{{
+      {{"a", 1}, {"b", 2}, {"c", 3}},
+      {{"a", 1}, {"x", 2}, {"c", 3}},
+      {{"x", 1}, {"b", 2}, {"c", 3}},
+      {{"x", 1}, {"b", 2}},
+      {{"x", 1}, {"b", 2}, {"c", 3}, {"d", 4}},
+      {},
+      {{rareKey, 1}, {"b", 2}},
+      {{rareKey, 1}, {"b", 3}},
+      {{"b", 3}, {rareKey, 1}},
+      {{"a\"\xFF", 1}, {"b", 2}},
+  }});
+}
+
+TEST(PayloadEncoderTest, PayloadAfterGivingBackHasTextOfItsOwn) {
+  PayloadEncoder encoder;
+  const Dictionary message{{"a", 1}};
+  EXPECT_EQ(encoder.encode(message), R"({"a":1})");
+  encoder.giveBack();
+  EXPECT_EQ(encoder.encode(message), R"({"a":1})");
+  EXPECT_FALSE(encoder.isRepeated());
+  encoder.giveBack();
+  EXPECT_EQ(encoder.encode({}), "{}");
+  EXPECT_EQ(encoder.encode({}), "{}");
+}
+
+TEST(PayloadEncoderTest, PayloadThatWasChangedIsEncodedAgain) {
+  PayloadEncoder encoder;
+  Dictionary message{{"a", 1}, {"b", 2}};
+  EXPECT_EQ(encoder.encode(message), R"({"a":1,"b":2})");
+  message.set("a", 3);
+  EXPECT_EQ(encoder.encode(message), R"({"a":3,"b":2})");
+  message.remove("a");
+  EXPECT_EQ(encoder.encode(message), R"({"b":2})");
+  message.set("c", 4);
+  EXPECT_EQ(encoder.encode(message), R"({"b":2,"c":4})");
+}
+
+TEST(PayloadEncoderTest, TextOfTheSizeOfAWordOrLessIsCopiedWhole) {
+  for (std::size_t length = 0; length <= 40; ++length) {
+    std::string text;
+    for (std::size_t at = 0; at < length; ++at) text += static_cast<char>('a' + at % 26);
+    EXPECT_EQ(encodeOne(text), "{\"k\":\"" + text + "\"}");
+  }
+}
+
 TEST(PayloadEncoderTest, FindsEqualPayloadsAlike) {
   const auto make = [] {
     return Dictionary{{"a", 1}, {"b", "text"}, {"c", Array{1.5, Date{2}}}, {"d", Dictionary{}}};

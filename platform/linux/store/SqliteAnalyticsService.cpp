@@ -9,7 +9,7 @@ bool SqliteAnalyticsService::isAnalyticsEventUsed(std::string_view eventName) {
   return known != nullptr ? known->isWanted : names_.matches(eventName);
 }
 
-void SqliteAnalyticsService::sendAnalyticsEventLazy(std::string eventName,
+void SqliteAnalyticsService::sendAnalyticsEventLazy(std::string_view eventName,
                                                     AnalyticsPayloadBuilder builder) {
   records_.addEvent(clock_.currentDate().secondsSince1970, eventName, std::move(builder));
 }

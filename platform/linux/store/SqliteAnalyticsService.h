@@ -17,7 +17,7 @@ class SqliteAnalyticsService final : public AnalyticsService {
 
   [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override;
   // Records the event with the time of the call. The builder runs later, on the writer's thread.
-  void sendAnalyticsEventLazy(std::string eventName, AnalyticsPayloadBuilder builder) override;
+  void sendAnalyticsEventLazy(std::string_view eventName, AnalyticsPayloadBuilder builder) override;
 
  private:
   EventNames& names_;
