@@ -39,9 +39,13 @@ std::uint64_t mixed(std::string_view text) {
 
 }  // namespace
 
+// Returns the first of the text's two slots if it is free or has the text, else the second.
 KeyCache::Slot& KeyCache::slotOf(std::string_view text) {
-  static_assert(kSlots == 256, "the index below is a byte");
-  return slots_[mixed(text) >> 56U];
+  static_assert(kSlots == 512, "the index below has nine bits");
+  const std::size_t index = mixed(text) >> 55U;
+  Slot& first = slots_[index];
+  if (!first.key.has_value() || first.text == text) return first;
+  return slots_[index ^ 1U];
 }
 
 KeyCache::Head KeyCache::find(std::string_view bytes) {
