@@ -1,19 +1,19 @@
 #include "tools/PreferenceWriting.h"
 
 #include <cerrno>
-#include <cstdlib>
 #include <system_error>
 #include <thread>
 #include <utility>
 
 #include <fcntl.h>
 #include <sys/file.h>
-#include <sys/stat.h>
+#include <sys/types.h>
 #include <unistd.h>
 
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/base/UniqueHandle.h"
 #include "platform/linux/settings/LinkedFiles.h"
+#include "tools/NewFile.h"
 
 namespace halvox::tools {
 namespace {
@@ -26,55 +26,8 @@ using platform::linux_::readPreferenceText;
 using platform::linux_::Result;
 using platform::linux_::UniqueFd;
 
-// Readable by everyone, unless the umask forbids it.
-constexpr mode_t kModeOfNewFiles = 0644;
-
 Failure<> failure(const std::filesystem::path& path, int error) {
   return {path.native() + ": " + errnoText(error)};
-}
-
-// A file under a temporary name in the directory of its target. The destructor deletes it unless it
-// was kept.
-class NewFile {
- public:
-  explicit NewFile(const std::filesystem::path& target)
-      // In the same directory, because a rename does not cross file systems.
-      : path_((target.parent_path() / ("." + target.filename().native() + ".XXXXXX")).native()),
-        descriptor_(::mkostemp(path_.data(), O_CLOEXEC)) {}
-  NewFile(const NewFile&) = delete;
-  NewFile& operator=(const NewFile&) = delete;
-  ~NewFile() {
-    if (descriptor_ && !isKept_) ::unlink(path_.c_str());
-  }
-
-  [[nodiscard]] bool write(std::string_view text, mode_t mode) {
-    if (!descriptor_ || ::fchmod(descriptor_.get(), mode) != 0) return false;
-    while (!text.empty()) {
-      const ssize_t count = ::write(descriptor_.get(), text.data(), text.size());
-      if (count < 0 && errno == EINTR) continue;
-      if (count < 0) return false;
-      text.remove_prefix(static_cast<std::size_t>(count));
-    }
-    // Without this fsync(), a crash after the rename could leave an empty file.
-    return ::fsync(descriptor_.get()) == 0;
-  }
-  // Renames the file to `target` and replaces a file of that name.
-  [[nodiscard]] bool keepAs(const std::filesystem::path& target) {
-    isKept_ = ::rename(path_.c_str(), target.c_str()) == 0;
-    return isKept_;
-  }
-
- private:
-  std::string path_;
-  UniqueFd descriptor_;
-  bool isKept_ = false;
-};
-
-mode_t modeOfNewFile() {
-  // The mask cannot be read without setting it. No other thread may create a file meanwhile.
-  const mode_t mask = ::umask(0);
-  ::umask(mask);
-  return kModeOfNewFiles & ~mask;
 }
 
 Result<void> replace(const std::filesystem::path& file, const std::string& text, mode_t mode,
