@@ -37,6 +37,7 @@ constexpr CommandGroup kGroups[] = {
     {"What the service stored", addRecordCommands, GroupPlace::kArguments},
     {"What the service stored", addSnapshotCommands, GroupPlace::kArguments},
     {"What the service stored", addSummaryCommand, GroupPlace::kArguments},
+    {"What the service stored", addReportCommand, GroupPlace::kArguments},
     {"What the service stored", addQueryCommands, GroupPlace::kArguments},
     {"Traces and drivers", addTraceCommands, GroupPlace::kArguments},
     {"Traces and drivers", addDriverCommand, GroupPlace::kArguments},

@@ -106,6 +106,11 @@ Result<TraceResults> readTraceResults(const std::string& file) {
   return results;
 }
 
+std::filesystem::path traceResultsFile(const std::filesystem::path& root) {
+  return root /
+         "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Traces/tracing_results.ssj";
+}
+
 TraceStatistics statisticsOf(std::vector<double> values) {
   std::ranges::sort(values);
   const auto atRank = [&](double share) {
@@ -117,6 +122,7 @@ TraceStatistics statisticsOf(std::vector<double> values) {
           .minimum = values.front(),
           .median = atRank(0.5),
           .percentile95 = atRank(0.95),
+          .percentile99 = atRank(0.99),
           .maximum = values.back()};
 }
 

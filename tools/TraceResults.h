@@ -1,5 +1,6 @@
 #pragma once
 
+#include <filesystem>
 #include <ostream>
 #include <string>
 #include <utility>
@@ -21,6 +22,7 @@ struct TraceStatistics {
   double minimum = 0;
   double median = 0;        // of an even number of values, the lower of the two in the middle
   double percentile95 = 0;  // the smallest value that at least 95 % of the values do not exceed
+  double percentile99 = 0;
   double maximum = 0;
 };
 
@@ -29,6 +31,9 @@ platform::linux_::Result<TraceResults> readTraceResults(const std::string& file)
 
 // `values` must not be empty.
 TraceStatistics statisticsOf(std::vector<double> values);
+
+// Returns where the service writes results below its storage root.
+std::filesystem::path traceResultsFile(const std::filesystem::path& root);
 
 // Writes the form that exportTrace() describes.
 void writeTraceEvents(const TraceResults& results, std::ostream& out);

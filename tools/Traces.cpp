@@ -35,8 +35,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr const char* kResultsFile =
-    "private/var/mobile/Library/Logs/Wreckbin/DiagnosticLogs/Audio/Traces/tracing_results.ssj";
 constexpr client::ServiceType kTestService = 11;
 // The range of codes that the service records.
 constexpr std::uint32_t kFirstCode = 0x21040000;
@@ -255,7 +253,7 @@ ExitStatus recordTrace(const RecordTrace& request, const CommonOptions& options,
   const auto loaded = serviceConfiguration(complain);
   if (const auto* status = std::get_if<ExitStatus>(&loaded)) return *status;
   const auto& configuration = std::get<platform::linux_::Configuration>(loaded);
-  const fs::path results = configuration.storage.root / kResultsFile;
+  const fs::path results = traceResultsFile(configuration.storage.root);
   // The service has another working directory.
   const std::string params = fs::absolute(request.params).string();
   // The service reports mistakes in this file only in its own log. Reading it here shows them to

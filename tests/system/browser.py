@@ -58,6 +58,8 @@ class Browser:
             target = next(info["targetId"] for info in targets if info["type"] == "page")
             self._session = self.call(
                 "Target.attachToTarget", targetId=target, flatten=True)["sessionId"]
+            # Without it, elements of a page that is not in front get no focus events.
+            self.call("Emulation.setFocusEmulationEnabled", enabled=True)
             for domain in ("Page", "Runtime", "Log", "Network"):
                 self.call(f"{domain}.enable")
         except BaseException:

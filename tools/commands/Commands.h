@@ -12,6 +12,7 @@ void addScriptCommands(CommandSet& commands);    // run, shell
 void addRecordCommands(CommandSet& commands);    // events, metrics, power, link
 void addQueryCommands(CommandSet& commands);     // sql, export
 void addStreamCommands(CommandSet& commands);    // streams
+void addReportCommand(CommandSet& commands);     // report
 void addSnapshotCommands(CommandSet& commands);  // snapshots
 void addSummaryCommand(CommandSet& commands);    // summary
 void addTraceCommands(CommandSet& commands);     // trace

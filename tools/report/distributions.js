@@ -1,26 +1,39 @@
 // The pictures of numbers: how often, how long, how many. Each has its table below it.
 import { axisX, axisY, barX, gridX, gridY, plot, rectY, ruleX, ruleY, text } from "@observablehq/plot";
+import { COLOURS, NO_DEVICE } from "./colours.js";
 import { element, numbers, picture, table } from "./elements.js";
-import { clock, count, day, duration, figure, milliseconds, moment, named, shortened, visible } from "./text.js";
+import { count, duration, figure, milliseconds, moment, named, shortened, timeTick, visible } from "./text.js";
 
-const COLOURS = Array.from({ length: 8 }, (_, index) => `var(--route-${index + 1})`);
 const STYLE = { fontSize: "12px", color: "var(--ink)" };
 const NUMBER = { number: true };
 const leftOf = (width) => (width < 560 ? 110 : 190);
 
-function legendOf(names) {
+// The driver reports have no blanks in the names of their channels.
+const MEASURES = { busytime: "busy time", waittime: "wait time" };
+const measureOf = (row) => MEASURES[row.measure] ?? row.measure;
+
+const COMMON_PREFIX = "com.tarno.halvox.";
+const withoutPrefix = (name) => (name.startsWith(COMMON_PREFIX) ? name.slice(COMMON_PREFIX.length) : name);
+
+function legendOf(names, colours = COLOURS) {
   return element(
     "ul",
     { class: "legend" },
     names.map((name, index) =>
-      element("li", {}, element("span", { class: "swatch", style: `background: ${COLOURS[index % 8]}` }), named(name)),
+      element("li", {}, element("span", { class: "swatch", style: `background: ${colours[index % colours.length]}` }), named(name)),
     ),
   );
 }
 
 // Horizontal bars, one for each row, in parts that are coloured by `part`.
-function bars(width, rows, { label, value, part, parts, axis }) {
+function bars(width, rows, { label, value, part, parts, axis, colours = COLOURS }) {
   const labels = [...new Set(rows.map(label))];
+  const sums = labels.map((name) => ({
+    name,
+    sum: rows.filter((row) => label(row) === name).reduce((sum, row) => sum + value(row), 0),
+  }));
+  // A scale of counts has no fractions.
+  const most = Math.max(...sums.map((row) => row.sum));
   return plot({
     width,
     height: labels.length * 28 + 56,
@@ -28,14 +41,15 @@ function bars(width, rows, { label, value, part, parts, axis }) {
     marginRight: 56,
     marginBottom: 36,
     style: STYLE,
-    x: { label: axis, nice: true, labelAnchor: "right" },
+    x: { label: axis, nice: true, labelAnchor: "right", axis: null },
     y: { domain: labels, label: null, tickSize: 0, tickFormat: (name) => shortened(name, width < 560 ? 15 : 27) },
-    color: { type: "ordinal", domain: parts, range: parts.map((_, index) => COLOURS[index % 8]) },
+    color: { type: "ordinal", domain: parts, range: parts.map((_, index) => colours[index % colours.length]) },
     marks: [
-      gridX({ stroke: "var(--line)", strokeOpacity: 1 }),
+      gridX({ stroke: "var(--line)", strokeOpacity: 1, ...(most <= 10 ? { interval: 1 } : {}) }),
+      axisX({ label: axis, tickFormat: figure, ...(most <= 10 ? { interval: 1 } : { ticks: width < 560 ? 4 : 8 }) }),
       barX(rows, { x: value, y: label, fill: part, insetTop: 3, insetBottom: 3, order: parts }),
       text(
-        labels.map((name) => ({ name, sum: rows.filter((row) => label(row) === name).reduce((sum, row) => sum + value(row), 0) })),
+        sums,
         { x: "sum", y: "name", text: (row) => figure(row.sum), textAnchor: "start", dx: 5, fill: "var(--ink)" },
       ),
       ruleX([0], { stroke: "var(--quiet)" }),
@@ -43,15 +57,17 @@ function bars(width, rows, { label, value, part, parts, axis }) {
   });
 }
 
-export function xrunsByApplication(rows) {
-  const devices = [...new Set(rows.map((row) => row.device || "no device reported"))];
-  const named = rows.map((row) => ({ ...row, device: row.device || "no device reported" }));
-  const shown = named.slice(0, 40);
+// `scale` has the colours of the devices.
+export function xrunsByApplication(rows, scale) {
+  const complete = rows.map((row) => ({ ...row, device: row.device || NO_DEVICE }));
+  const used = scale.domain.filter((device) => complete.some((row) => row.device === device));
+  const usedColours = used.map((device) => scale.range[scale.domain.indexOf(device)]);
+  const shown = complete.slice(0, 40);
   return [
-    legendOf(devices),
+    legendOf(used, usedColours),
     picture(
       `Bars: xruns of each application, by device. ${shown.slice(0, 5).map((row) => `${named(row.app)} on ${named(row.device)}: ${count(row.xruns)}`).join("; ")}`,
-      (width) => bars(width, shown, { label: (row) => row.app, value: (row) => row.xruns, part: (row) => row.device, parts: devices, axis: "xruns" }),
+      (width) => bars(width, shown, { label: (row) => row.app, value: (row) => row.xruns, part: (row) => row.device, parts: used, colours: usedColours, axis: "xruns" }),
     ),
     table("Xruns of each application and device", [
       ["Application", (row) => named(row.app)],
@@ -60,7 +76,7 @@ export function xrunsByApplication(rows) {
       ["Missed cycles", (row) => count(row.cycles), NUMBER],
       ["Time lost", (row) => milliseconds(row.ms), NUMBER],
       ["Longest", (row) => milliseconds(row.longest), NUMBER],
-    ], named),
+    ], complete),
   ];
 }
 
@@ -77,7 +93,12 @@ function bucketsOf(measure) {
 
 export function histogram(label, measure, unit) {
   const rows = bucketsOf(measure);
-  const percentiles = [["p50", measure.p50], ["p95", measure.p95], ["p99", measure.p99]].filter(([, value]) => value > 0);
+  // Percentiles in one bucket share a line.
+  const byValue = new Map();
+  for (const name of ["p50", "p95", "p99"]) {
+    if (measure[name] > 0) byValue.set(measure[name], [...(byValue.get(measure[name]) ?? []), name]);
+  }
+  const percentiles = [...byValue].map(([value, names]) => [names.join(" "), value]);
   return picture(
     `Histogram: ${label}. Half at most ${figure(measure.p50)} ${unit}, 95 % at most ${figure(measure.p95)} ${unit}, `
       + `highest ${figure(measure.max)} ${unit}.`,
@@ -128,13 +149,13 @@ function percentileTable(caption, first, rows, unitOf) {
 export function deviceTimes(devices) {
   return [
     ...devices.map((row) => {
-      const title = `${named(row.device)}: ${named(row.measure)}`;
+      const title = `${named(row.device)}: ${named(measureOf(row))}`;
       return element("div", {}, element("h3", {}, title), histogram(title, row, row.unit),
         numbers("The numbers of this picture", () => bucketTable(title, row, row.unit)));
     }),
     percentileTable("Times of the devices; each figure is the upper bound of its bucket", [
       ["Device", (row) => named(row.device)],
-      ["Measure", (row) => named(row.measure)],
+      ["Measure", (row) => named(measureOf(row))],
     ], devices, (row) => row.unit),
   ];
 }
@@ -163,9 +184,9 @@ export function eventsOverTime(names) {
   for (const one of top) {
     const counts = new Array(steps).fill(0);
     for (const [bin, n] of one.bins) counts[bin] = n;
-    add(one.name, counts);
+    add(withoutPrefix(one.name), counts);
   }
-  const drawn = top.map((one) => one.name);
+  const drawn = top.map((one) => withoutPrefix(one.name));
   if (others.some((n) => n > 0)) {
     add("other names", others);
     drawn.push("other names");
@@ -175,7 +196,7 @@ export function eventsOverTime(names) {
   return [
     legendOf(drawn),
     picture(
-      `Bars over time: messages of each name in steps of ${duration(step)}. ${top.slice(0, 4).map((one) => `${named(one.name)}: ${count(one.count)}`).join("; ")}`,
+      `Bars over time: messages of each name in steps of ${duration(step)}. ${top.slice(0, 4).map((one) => `${named(withoutPrefix(one.name))}: ${count(one.count)}`).join("; ")}`,
       (width) =>
         plot({
           width,
@@ -189,7 +210,7 @@ export function eventsOverTime(names) {
           color: { type: "ordinal", domain: drawn, range: COLOURS },
           marks: [
             gridY({ stroke: "var(--line)", strokeOpacity: 1 }),
-            axisX({ ticks: width < 560 ? 3 : 7, label: null, tickFormat: (at) => tick(at, span) }),
+            axisX({ ticks: width < 560 ? 3 : 7, label: null, tickFormat: timeTick(span) }),
             axisY({ ticks: 4, tickFormat: figure, label: `messages in ${duration(step)}` }),
             rectY(visibleRows, { x1: "at", x2: "to", y: "n", fill: "name", order: drawn, insetLeft: 0.5 }),
             ruleY([0], { stroke: "var(--quiet)" }),
@@ -197,13 +218,6 @@ export function eventsOverTime(names) {
         }),
     ),
   ];
-}
-
-function tick(at, span) {
-  const seconds = at.getTime() / 1000;
-  if (span < 3 * 3600) return clock(seconds).slice(0, 8);
-  if (span < 2 * 86400) return clock(seconds).slice(0, 5);
-  return day(seconds).slice(5);
 }
 
 export function nameTable(names) {

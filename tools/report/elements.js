@@ -96,16 +96,32 @@ export function numbers(title, makeTable, { open = false } = {}) {
   return details;
 }
 
-// A picture that is drawn again when its width changes.
-export function picture(label, draw, { role = "img" } = {}) {
-  const frame = element("div", { class: "frame", role, "aria-label": label });
+// A picture that is drawn when it comes near the screen or is printed, and again when its width
+// changes. What nobody looks at yet does not delay what they do.
+export function picture(label, draw, { height = 170 } = {}) {
+  const frame = element("div", { class: "frame", role: "img", "aria-label": label, style: `min-height: ${height}px` });
   let width = 0;
+  let near = false;
   const redraw = () => {
     const now = Math.floor(frame.clientWidth);
-    if (now === width || now === 0) return;
+    if (!near || now === width || now === 0) return;
     width = now;
     frame.replaceChildren(draw(width));
   };
+  const drawNow = () => {
+    near = true;
+    redraw();
+  };
   new ResizeObserver(redraw).observe(frame);
+  const watch = new IntersectionObserver(
+    (entries) => {
+      if (!entries.some((entry) => entry.isIntersecting)) return;
+      watch.disconnect();
+      drawNow();
+    },
+    { rootMargin: "600px" },
+  );
+  watch.observe(frame);
+  window.addEventListener("beforeprint", drawNow);
   return frame;
 }

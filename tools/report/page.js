@@ -1,4 +1,5 @@
 // The page: reads the data and lays out the sections. The data is described in docs/report.md.
+import { deviceScale } from "./colours.js";
 import * as draw from "./distributions.js";
 import { element, numbers, section, table } from "./elements.js";
 import { count, duration, figure, milliseconds, moment, named, plural, visible } from "./text.js";
@@ -51,7 +52,7 @@ function figures() {
     { class: "figures" },
     entry("Xruns", count(totals.xruns), totals.xruns > 0),
     entry("Time lost", milliseconds(totals.xrunMs), totals.xruns > 0),
-    entry("Missed cycles", count(totals.missedCycles), totals.missedCycles > 0),
+    entry("Missed cycles", totals.xruns > 0 && totals.missedCycles === 0 ? "–" : count(totals.missedCycles), totals.missedCycles > 0),
     entry("Streams", count(totals.streams)),
     entry("Messages", count(totals.messages)),
     entry("Issue metrics", count(totals.metrics)),
@@ -62,14 +63,17 @@ function figures() {
 
 const xrunColumns = (show) => [
   ["Time", (xrun) => element("a", { href: `#xrun-${xrun.index}`, onclick: (event) => show(event, xrun.index) }, moment(xrun.t))],
-  ["Application", (xrun) => named(xrun.app)],
   ["Lost", (xrun) => milliseconds(xrun.ms), NUMBER],
-  ["Missed cycles", (xrun) => (xrun.cycles === null ? "–" : count(xrun.cycles)), NUMBER],
+  ["Application", (xrun) => named(xrun.app)],
+  ["Missed cycles", (xrun) => (xrun.cycles > 0 ? count(xrun.cycles) : "–"), NUMBER],
   ["Device", (xrun) => named(xrun.device)],
   ["Late", (xrun) => named(xrun.late) || "–"],
   ["Part", (xrun) => visible(xrun.role) || "–"],
   ["Quantum", (xrun) => (xrun.quantum ? `${count(xrun.quantum)} at ${count(xrun.rate)} Hz` : "–"), NUMBER],
 ];
+
+// Settled when the whole page is drawn, as far as it is on the screen.
+let complete = Promise.resolve();
 
 const around = element("div", { id: "around", tabindex: -1, role: "region", "aria-label": "Messages around the chosen xrun" });
 
@@ -93,6 +97,12 @@ function showMessages(index) {
   );
 }
 
+function volumesOf(stream) {
+  const parts = stream.volumeTimes.map(([volume, seconds]) => `${duration(seconds)} at ${figure(volume)}`);
+  if (stream.otherVolumes > 0) parts.push(`${duration(stream.otherVolumes)} at others`);
+  return parts.join(", ") || "–";
+}
+
 function streamsTable() {
   return table(`${plural(data.streams.length, "stream")}, in the order of their starts`, [
     ["Started", (stream) => moment(stream.from)],
@@ -101,11 +111,11 @@ function streamsTable() {
     ["Direction", (stream) => visible(stream.direction)],
     ["Ran", (stream) => duration(stream.ran), NUMBER],
     ["Devices", (stream) => [...new Set(stream.routes.map(([, device]) => named(device)))].join(" → ")],
-    ["Volume", (stream) => visible(stream.volume)],
+    ["Time at volume", volumesOf],
     ["Format", (stream) => stream.formats.map(([, format]) => named(format)).join(" → ")],
     ["Xruns", (stream) => count(stream.xruns), NUMBER],
     ["Lost", (stream) => milliseconds(stream.xrunMs), NUMBER],
-    ["Ended", (stream) => (stream.to === null ? "still open" : `${visible(stream.end)}, ${moment(stream.to)}`)],
+    ["Ended", (stream) => (stream.open ? visible(stream.end) : `${visible(stream.end)}, ${moment(stream.to)}`)],
   ], data.streams);
 }
 
@@ -118,6 +128,7 @@ function timelineSection() {
     around.focus({ preventScroll: true });
     around.scrollIntoView({ block: "nearest" });
   });
+  complete = line.drawn;
   const show = (event, index) => {
     event.preventDefault();
     line.goTo(index);
@@ -162,7 +173,7 @@ function sections() {
   const add = (id, name, condition, ...children) => {
     if (condition) made.push(section(id, name, ...children));
   };
-  add("applications", "Xruns by application and device", data.byApplication.length > 0, ...(data.byApplication.length > 0 ? draw.xrunsByApplication(data.byApplication) : []));
+  add("applications", "Xruns by application and device", data.byApplication.length > 0, ...(data.byApplication.length > 0 ? draw.xrunsByApplication(data.byApplication, deviceScale(data)) : []));
   add("devices", "Cycles of the devices", data.devices.length > 0,
     element("p", { class: "quiet" }, "Each session reports what its devices did while it ran. A cycle in which several sessions ran is therefore counted several times."),
     ...(data.devices.length > 0 ? draw.deviceTimes(data.devices) : []),
@@ -207,6 +218,9 @@ document.getElementById("page").replaceWith(
   element("main", { id: "main", tabindex: -1 }, verdict(), figures(), ...content),
   element("footer", { class: "quiet" }, element("p", {}, `${figure(totals.events)} events, ${figure(totals.links)} messages of the link.`)),
 );
-// Tests wait for this attribute. The mark tells them when the page was complete.
-document.documentElement.dataset.ready = "true";
-performance.mark("report-ready");
+performance.mark("report-laid-out");
+complete.then(() => {
+  performance.mark("report-ready");
+  // Tests wait for this attribute.
+  document.documentElement.dataset.ready = "true";
+});

@@ -69,3 +69,15 @@ export function duration(seconds) {
 export function plural(number, one, many = `${one}s`) {
   return `${count(number)} ${number === 1 ? one : many}`;
 }
+
+// Shows the times of an axis that spans so many seconds.
+export function timeTick(span) {
+  return (at) => {
+    const seconds = at.getTime() / 1000;
+    const text = clock(seconds);
+    if (span < 20) return text.slice(3);
+    if (span < 3 * 3600) return text.slice(0, 8);
+    if (span < 2 * 86400) return text.slice(0, 5);
+    return text.startsWith("00:00") ? day(seconds).slice(5) : `${day(seconds).slice(5)}\n${text.slice(0, 5)}`;
+  };
+}

@@ -3,15 +3,14 @@
 import { axisX, dot, gridX, plot, rect, ruleX, ruleY, text } from "@observablehq/plot";
 import { select } from "d3-selection";
 import { zoom, zoomIdentity } from "d3-zoom";
+import { NO_DEVICE, deviceScale } from "./colours.js";
 import { element } from "./elements.js";
-import { clock, count, day, duration, figure, milliseconds, moment, named, plural, shortened, visible } from "./text.js";
+import { clock, count, duration, figure, milliseconds, moment, named, plural, shortened, timeTick, visible } from "./text.js";
 
 const MOST_LANES = 40;
 const MOST_TRACKS = 6;
 const LANE_HEIGHT = 46;
 const NEAREST = 0.05; // seconds: the shortest time that the whole width may show
-const COLOURS = Array.from({ length: 8 }, (_, index) => `var(--route-${index + 1})`);
-const NO_DEVICE = "no device reported";
 const OTHERS = "other applications";
 
 // What a person must know about an xrun, in one sentence each.
@@ -30,11 +29,11 @@ export function describeXrun(xrun) {
 }
 
 // The parts of a stream with one volume and one device: what is drawn as one rectangle.
-function partsOf(stream, lane, end) {
+function partsOf(stream, lane) {
   const changes = new Set([stream.from]);
   for (const [t] of stream.volumes) changes.add(t);
   for (const [t] of stream.routes) changes.add(t);
-  const last = stream.to ?? end;
+  const last = stream.to;
   const times = [...changes].filter((t) => t >= stream.from && t < last).sort((a, b) => a - b);
   const valueAt = (list, t) => list.reduce((found, entry) => (entry[0] <= t ? entry : found), undefined);
   return times.map((from, index) => {
@@ -45,16 +44,34 @@ function partsOf(stream, lane, end) {
       stream,
       from,
       to: times[index + 1] ?? last,
-      // A stream that reports no volume fills its lane: it ran, and how loud is not known.
-      height: volume === undefined ? 1 : volume[2] ? volume[1] : 0,
+      volume: volume?.[1] ?? null,
+      // A stream that runs and reports no volume fills its lane.
+      height: volume === undefined || !volume[2] ? 0 : (volume[1] ?? 1),
       device: route?.[1] || NO_DEVICE,
     };
   });
 }
 
+// Joins neighbouring parts of a stream that are narrower than `least` seconds: what cannot be seen is
+// not drawn. The joined part has the greatest height and the device of the first.
+function joined(parts, least) {
+  const list = [];
+  let open = null;
+  for (const part of parts) {
+    if (open && open.stream === part.stream && part.to - open.from < least) {
+      open = { ...open, to: part.to, height: Math.max(open.height, part.height), volume: Math.max(open.volume, part.volume) };
+      list[list.length - 1] = open;
+    } else {
+      list.push(part);
+      open = part;
+    }
+  }
+  return list;
+}
+
 // Places the streams of each application on as few tracks as possible, so that no two streams of a
 // track overlap.
-function lanesOf(streams, xruns, end) {
+function lanesOf(streams, xruns) {
   const byApp = new Map();
   const of = (app) => byApp.get(app) ?? byApp.set(app, { app, streams: [], xruns: 0, ran: 0 }).get(app);
   for (const stream of streams) {
@@ -77,7 +94,7 @@ function lanesOf(streams, xruns, end) {
     for (const stream of entry.streams.sort((a, b) => a.from - b.from)) {
       let track = ends.findIndex((free) => free <= stream.from);
       if (track < 0) track = Math.min(ends.length, MOST_TRACKS - 1);
-      ends[track] = stream.to ?? end;
+      ends[track] = stream.to;
       laneOfStream.set(stream, lanes.length + track);
     }
     laneOfApp.set(entry.app, lanes.length);
@@ -91,27 +108,17 @@ function lanesOf(streams, xruns, end) {
   return { lanes, laneOfStream, laneOfApp, hidden };
 }
 
-function timeTick(span) {
-  return (at) => {
-    const seconds = at.getTime() / 1000;
-    const text = clock(seconds);
-    if (span < 20) return text.slice(3);
-    if (span < 3 * 3600) return text.slice(0, 8);
-    if (span < 2 * 86400) return text.slice(0, 5);
-    return text.startsWith("00:00") ? day(seconds).slice(5) : `${day(seconds).slice(5)}\n${text.slice(0, 5)}`;
-  };
-}
-
 // Makes the time line. `onChoose(index)` is called with the index of the xrun that was chosen.
 export function timeline(data, onChoose) {
   const { streams, xruns, marks } = data;
   const margin = Math.max((data.period.to - data.period.from) * 0.01, 0.05);
   const whole = [data.period.from - margin, data.period.to + margin];
-  const { lanes, laneOfStream, laneOfApp, hidden } = lanesOf(streams, xruns, data.period.to);
+  const { lanes, laneOfStream, laneOfApp, hidden } = lanesOf(streams, xruns);
   const parts = streams.flatMap((stream) =>
-    laneOfStream.has(stream) ? partsOf(stream, laneOfStream.get(stream), data.period.to) : [],
+    laneOfStream.has(stream) ? partsOf(stream, laneOfStream.get(stream)) : [],
   );
-  const devices = [...new Set(parts.map((part) => part.device))];
+  const scale = deviceScale(data);
+  const used = new Set(parts.map((part) => part.device));
   const loudest = Math.max(1, ...parts.map((part) => part.height));
   const points = xruns.map((xrun, index) => ({
     ...xrun,
@@ -125,13 +132,14 @@ export function timeline(data, onChoose) {
 
   const frame = element("div", {
     class: "frame timeline",
+    style: `min-height: ${lanes.length * LANE_HEIGHT + 62}px`,
     role: "group",
     "aria-label": "Time line of the streams. Tab reaches the first xrun; the arrow keys go from one to the next, "
       + "Enter shows the messages around it.",
   });
   const drawing = element("div");
   const tip = element("div", { class: "tip", hidden: true, "aria-hidden": "true" });
-  const shown = element("span", { class: "quiet", role: "status" });
+  const shown = element("span", { class: "timeline-shown quiet", role: "status" });
   frame.append(drawing, tip);
 
   const narrow = () => width < 560;
@@ -155,7 +163,7 @@ export function timeline(data, onChoose) {
       y: { axis: null, domain: [0, loudest * 1.25] },
       fy: { domain: lanes.map((_, lane) => lane), padding: 0.06, label: null, axis: null },
       r: { type: "identity" },
-      color: { type: "ordinal", domain: devices, range: devices.map((_, index) => COLOURS[index % COLOURS.length]) },
+      color: { type: "ordinal", ...scale },
       marks: [
         text(lanes.map((_, lane) => lane), {
           fy: (lane) => lane,
@@ -168,9 +176,9 @@ export function timeline(data, onChoose) {
         axisX({ anchor: "bottom", tickFormat: timeTick(span), ticks: narrow() ? 3 : 7, label: null }),
         gridX({ ticks: narrow() ? 3 : 7, stroke: "var(--line)", strokeOpacity: 1 }),
         // The first rectangle shows how long a stream existed. Those above it show how loud it was.
-        rect(streams.filter((stream) => laneOfStream.has(stream) && inside(stream.from, stream.to ?? data.period.to)), {
+        rect(streams.filter((stream) => laneOfStream.has(stream) && inside(stream.from, stream.to)), {
           x1: (stream) => clip(stream.from),
-          x2: (stream) => clip(stream.to ?? data.period.to),
+          x2: (stream) => clip(stream.to),
           y1: 0,
           y2: 1,
           fy: (stream) => laneOfStream.get(stream),
@@ -178,7 +186,7 @@ export function timeline(data, onChoose) {
           stroke: "var(--line)",
           ariaHidden: "true",
         }),
-        rect(parts.filter((part) => inside(part.from, part.to)), {
+        rect(joined(parts.filter((part) => inside(part.from, part.to)), (span / width) * 2), {
           x1: (part) => clip(part.from),
           x2: (part) => clip(part.to),
           y1: 0,
@@ -227,14 +235,13 @@ export function timeline(data, onChoose) {
     });
     svg.removeAttribute("class");
     prepareMarks(svg);
-    prepareParts(svg);
     drawing.replaceChildren(svg);
     shown.textContent = `Shown: ${moment(domain[0])} to ${clock(domain[1])} (${duration(span)})`;
   }
 
   function describePart(part) {
     const stream = part.stream;
-    const volume = stream.volumes.length === 0 ? "volume not reported" : part.height > 0 ? `volume ${figure(part.height)}` : "silent";
+    const volume = part.height === 0 ? "silent" : part.volume === null ? "volume not reported" : `volume ${figure(part.volume)}`;
     return `${named(stream.app)}, ${stream.direction || "stream"}, ${volume}, ${named(part.device)}, `
       + `${moment(part.from)}, for ${duration(part.to - part.from)}`;
   }
@@ -248,27 +255,39 @@ export function timeline(data, onChoose) {
       link.setAttribute("aria-label", path.getAttribute("aria-label"));
       path.removeAttribute("aria-label");
       link.classList.toggle("chosen", index === chosen);
-      link.addEventListener("focus", () => {
-        focused = index;
-        showTip(link, describeXrun(xruns[index]));
-      });
-      link.addEventListener("blur", hideTip);
-      link.addEventListener("pointerenter", () => showTip(link, describeXrun(xruns[index])));
-      link.addEventListener("pointerleave", hideTip);
-      link.addEventListener("click", (event) => {
-        event.preventDefault();
-        choose(index);
-        onChoose(index);
-      });
     }
   }
 
-  function prepareParts(svg) {
-    for (const shape of svg.querySelectorAll(".part rect, .mark line")) {
-      const lines = shape.getAttribute("aria-label").split(", ");
-      shape.addEventListener("pointerenter", () => showTip(shape, [lines[0], lines.slice(1).join(", ")]));
-      shape.addEventListener("pointerleave", hideTip);
-    }
+  // One listener for all marks: there may be 2,000, and they are drawn anew with each zoom.
+  function onMarks(kind, action) {
+    drawing.addEventListener(kind, (event) => {
+      const link = event.target.closest("a[data-xrun]");
+      if (link) action(link, Number(link.dataset.xrun), event);
+    });
+  }
+  onMarks("focusin", (link, index) => {
+    focused = index;
+    showTip(link, describeXrun(xruns[index]));
+  });
+  onMarks("pointerover", (link, index) => showTip(link, describeXrun(xruns[index])));
+  for (const kind of ["focusout", "pointerout"]) onMarks(kind, hideTip);
+  onMarks("click", (link, index, event) => {
+    event.preventDefault();
+    choose(index);
+    onChoose(index);
+  });
+
+  for (const [kind, action] of [
+    ["pointerover", (shape) => {
+      const [first, ...rest] = shape.getAttribute("aria-label").split(", ");
+      showTip(shape, [first, rest.join(", ")]);
+    }],
+    ["pointerout", hideTip],
+  ]) {
+    drawing.addEventListener(kind, (event) => {
+      const shape = event.target.closest(".part rect, .mark line");
+      if (shape) action(shape);
+    });
   }
 
   function showTip(target, [first, ...rest]) {
@@ -330,8 +349,8 @@ export function timeline(data, onChoose) {
     .filter((event) => (event.type === "wheel" ? event.ctrlKey || event.metaKey || event.shiftKey
       : event.type.startsWith("touch") ? event.touches.length > 1 : !event.button))
     .on("zoom", ({ transform }) => {
-      const scale = (whole[1] - whole[0]) / plotWidth();
-      const from = whole[0] + ((left() - transform.x) / transform.k - left()) * scale;
+      const perPixel = (whole[1] - whole[0]) / plotWidth();
+      const from = whole[0] + ((left() - transform.x) / transform.k - left()) * perPixel;
       domain = [from, from + (whole[1] - whole[0]) / transform.k];
       hideTip();
       cancelAnimationFrame(requested);
@@ -342,9 +361,9 @@ export function timeline(data, onChoose) {
     const total = whole[1] - whole[0];
     const span = Math.min(Math.max(to - from, NEAREST), total);
     const start = Math.min(Math.max((from + to - span) / 2, whole[0]), whole[1] - span);
-    const scale = total / span;
+    const factor = total / span;
     const first = left() + ((start - whole[0]) / total) * plotWidth();
-    select(drawing).call(zoomer.transform, zoomIdentity.translate(left() - scale * first, 0).scale(scale));
+    select(drawing).call(zoomer.transform, zoomIdentity.translate(left() - factor * first, 0).scale(factor));
     cancelAnimationFrame(requested);
     draw();
   }
@@ -393,23 +412,36 @@ export function timeline(data, onChoose) {
   const legend = element(
     "ul",
     { class: "legend", "aria-label": "Colours and marks" },
-    devices.map((device, index) =>
-      element("li", {}, element("span", { class: "swatch", style: `background: ${COLOURS[index % COLOURS.length]}` }), named(device)),
+    scale.domain.map((device, index) =>
+      used.has(device)
+        ? element("li", {}, element("span", { class: "swatch", style: `background: ${scale.range[index]}` }), named(device))
+        : null,
     ),
     xruns.length > 0 ? element("li", {}, element("span", { class: "swatch xrun" }), "xrun: larger marks lost more") : null,
     marks.length > 0 ? element("li", {}, element("span", { class: "swatch event" }), "changed settings or a capture") : null,
   );
 
+  let whenDrawn;
+  const drawn = new Promise((resolve) => {
+    whenDrawn = resolve;
+  });
+  function fit() {
+    zoomer.extent([[left(), 0], [width - right, 100]]).translateExtent([[left(), 0], [width - right, 100]]);
+    setDomain(domain);
+    whenDrawn();
+  }
   new ResizeObserver(() => {
     const now = Math.floor(frame.clientWidth);
     if (now === width || now === 0) return;
+    // With thousands of marks the first drawing takes a moment. What stands above is shown before it.
+    const isFirst = width === 0;
     width = now;
-    zoomer.extent([[left(), 0], [width - right, 100]]).translateExtent([[left(), 0], [width - right, 100]]);
-    setDomain(domain);
+    if (isFirst) setTimeout(fit);
+    else fit();
   }).observe(frame);
   select(drawing).call(zoomer);
 
-  return { element: element("div", {}, legend, tools, frame), goTo, hidden };
+  return { element: element("div", {}, legend, tools, frame), goTo, hidden, drawn };
 }
 
 // A triangle that points down, to its moment.

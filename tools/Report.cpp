@@ -1,0 +1,201 @@
+#include "tools/Report.h"
+
+#include <cerrno>
+#include <chrono>
+#include <filesystem>
+#include <string_view>
+#include <system_error>
+#include <utility>
+#include <variant>
+
+#include "analysis/ReportBuilder.h"
+#include "analysis/StoreRecordSource.h"
+
+#include "platform/linux/base/ErrnoText.h"
+#include "platform/linux/runtime/Version.h"
+#include "platform/linux/store/reading/StoreReader.h"
+#include "platform/linux/store/reading/StoreUse.h"
+#include "platform/value.h"
+#include "tools/Complaint.h"
+#include "tools/JsonText.h"
+#include "tools/NewFile.h"
+#include "tools/ReportJson.h"
+#include "tools/ReportPage.h"
+#include "tools/ServiceConfiguration.h"
+#include "tools/StoreRun.h"
+#include "tools/TraceResults.h"
+
+namespace halvox::tools {
+namespace {
+
+using analysis::ReportData;
+using platform::Dictionary;
+using platform::linux_::errnoText;
+using platform::linux_::Failure;
+using platform::linux_::Result;
+using platform::linux_::StoreReader;
+using platform::linux_::StoreUse;
+
+constexpr std::string_view kStandardOutput = "-";
+
+double now() {
+  const auto time = std::chrono::system_clock::now().time_since_epoch();
+  return std::chrono::duration<double>(time).count();
+}
+
+double timeOf(const std::filesystem::path& file) {
+  std::error_code ignored;
+  const auto written = std::filesystem::last_write_time(file, ignored);
+  const auto time = std::chrono::file_clock::to_sys(written).time_since_epoch();
+  return std::chrono::duration<double>(time).count();
+}
+
+ReportTraceInterval intervalOf(std::string name, std::vector<double> nanoseconds) {
+  constexpr double kNanosecondsPerMicrosecond = 1000;
+  ReportTraceInterval interval;
+  interval.name = std::move(name);
+  for (double& value : nanoseconds) {
+    value /= kNanosecondsPerMicrosecond;
+    interval.counts.addValue(value);
+  }
+  const TraceStatistics statistics = statisticsOf(std::move(nanoseconds));
+  interval.count = statistics.count;
+  interval.median = statistics.median;
+  interval.percentile95 = statistics.percentile95;
+  interval.percentile99 = statistics.percentile99;
+  interval.maximum = statistics.maximum;
+  return interval;
+}
+
+// Returns the newest results of a trace. Without any, or if they cannot be read, there are none: a
+// report is about the records, and most services trace nothing.
+std::optional<ReportTrace> newestTrace(const Complaint& complain) {
+  const auto configuration = serviceConfiguration(complain);
+  if (std::holds_alternative<ExitStatus>(configuration)) return std::nullopt;
+  const auto file =
+      traceResultsFile(std::get<platform::linux_::Configuration>(configuration).storage.root);
+  auto results = readTraceResults(file.native());
+  if (!results) return std::nullopt;
+  ReportTrace trace{.file = file.native(), .when = timeOf(file)};
+  for (auto& [name, values] : results->values) {
+    if (!values.empty()) trace.intervals.push_back(intervalOf(name, std::move(values)));
+  }
+  if (trace.intervals.empty()) return std::nullopt;
+  return trace;
+}
+
+// What a reader must know about what is not in the report.
+std::vector<std::string> notesOf(const ReportData& data) {
+  const analysis::ReportTotals& totals = data.totals;
+  std::vector<std::string> notes{
+      "Each message is recorded as two events, under com.tarno.halvox and under its service's "
+      "name: " +
+          std::to_string(totals.messages) + " messages, " + std::to_string(totals.events) +
+          " events. Pictures and sums count a message once.",
+      std::to_string(totals.linkMessages) +
+          " messages went through the real-time link into this store. A session does not pass on a "
+          "message that repeats the one before it; a message outside a started session goes out "
+          "once, and none does if the link is disabled or leads to another server.",
+      "What the service itself drops or refuses, such as records on a full disk, it counts with "
+      "the "
+      "reason in its log, not in this store: at its end, and whenever it receives SIGUSR1.",
+      "The store keeps records as long as [storage] of the configuration says. What it has deleted "
+      "is not in this report.",
+  };
+  return notes;
+}
+
+// The whole page.
+std::string pageOf(const ReportData& data, const ReportFrame& frame) {
+  std::string page(reportPageBeforeData());
+  appendReportJson(data, frame, page);
+  page += reportPageAfterData();
+  return page;
+}
+
+Result<void> writeFile(const std::filesystem::path& file, std::string_view page) {
+  std::error_code ignored;
+  // A rename would fail as well, but after the whole page was written, and with another reason.
+  if (std::filesystem::is_directory(file, ignored)) {
+    return Failure<>{file.native() + " is a directory; expected a file to write"};
+  }
+  NewFile made(file);
+  if (!made.write(page, modeOfNewFile()) || !made.keepAs(file)) {
+    return Failure<>{file.native() + ": " + errnoText(errno)};
+  }
+  return {};
+}
+
+// How streams end that nothing ended, as `halvoxctl streams` has it.
+analysis::StreamBuilder::Finish finishOf(const WriteReport& request, StoreUse use) {
+  const double present = now();
+  // What came after the period is not known.
+  if (request.until && *request.until < present) return {.now = request.until};
+  return {.now = use == StoreUse::kServed ? std::optional(present) : std::nullopt,
+          .serviceIsGone = use == StoreUse::kNotServed};
+}
+
+Result<ReportData> readRecords(const WriteReport& request, StoreReader& reader, StoreUse use) {
+  analysis::StoreRecordSource source(reader);
+  analysis::ReportBuilder builder;
+  const auto read = source.forEach({.since = request.since,
+                                    .until = request.until,
+                                    .messages = true,
+                                    .metrics = true,
+                                    .power = true,
+                                    .snapshots = true},
+                                   [&](const analysis::Record& record) { builder.add(record); });
+  if (!read) return read.error();
+  return builder.finish(finishOf(request, use));
+}
+
+}  // namespace
+
+ExitStatus writeReport(const WriteReport& request, const CommonOptions& options,
+                       const ToolStreams& streams) {
+  const Complaint complain("report", options.form(), streams.output, streams.errors);
+  if (reportPageBeforeData().empty()) {
+    return complain(ExitStatus::kRefused,
+                    "this halvoxctl was built without the page of reports; configure its build "
+                    "with -DHALVOX_REPORT=ON");
+  }
+  const auto directory = storeDirectory(request.database, complain);
+  if (const auto* status = std::get_if<ExitStatus>(&directory)) return *status;
+  const auto& path = std::get<std::filesystem::path>(directory);
+  const StoreUse use = platform::linux_::storeUse(path);
+  StoreReader reader;
+  if (const auto opened = reader.open(path); !opened) {
+    return complain(ExitStatus::kNoService, opened.error().message, "no-store");
+  }
+  auto data = readRecords(request, reader, use);
+  if (!data) return complain(ExitStatus::kNoService, data.error().message, "no-store");
+  ReportFrame frame{.program = "halvoxctl " + std::string(platform::linux_::halvoxVersion()),
+                    .store = (path / "halvox.db").native(),
+                    .made = now(),
+                    .since = request.since,
+                    .until = request.until};
+  // A named store need not be that of the service whose traces the configuration leads to.
+  if (request.database.empty()) frame.trace = newestTrace(complain);
+  frame.notes = notesOf(*data);
+  const std::string page = pageOf(*data, frame);
+  if (request.to == kStandardOutput) {
+    streams.output << page;
+    return ExitStatus::kDone;
+  }
+  const auto written = writeFile(request.to, page);
+  if (!written) return complain(ExitStatus::kCannotWrite, written.error().message);
+  const analysis::ReportTotals& totals = data->totals;
+  if (options.form() == OutputForm::kJson) {
+    streams.output << toJson(Dictionary{{"file", request.to},
+                                        {"streams", totals.streams},
+                                        {"xruns", totals.xruns},
+                                        {"messages", totals.messages}})
+                   << '\n';
+  } else {
+    streams.output << harmlessText(request.to) << ": " << totals.streams << " streams, "
+                   << totals.xruns << " xruns, " << totals.messages << " messages\n";
+  }
+  return ExitStatus::kDone;
+}
+
+}  // namespace halvox::tools
