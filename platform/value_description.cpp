@@ -1,39 +1,38 @@
+#include "platform/value_description.h"
+
 #include <array>
 #include <charconv>
 #include <chrono>
 #include <cmath>
 #include <cstdio>
 
-#include "platform/value.h"
-
 namespace halvox::platform {
 namespace {
 
 template <typename Number>
-std::string shortest(Number number) {
+void appendShortest(std::string& text, Number number) {
   std::array<char, 32> buffer;
   const auto result = std::to_chars(buffer.data(), buffer.data() + buffer.size(), number);
-  return {buffer.data(), result.ptr};
+  text.append(buffer.data(), result.ptr);
 }
 
-std::string describeNumber(const Value& value) {
+void appendNumber(std::string& text, const Value& value) {
   switch (value.numberKind()) {
     case NumberKind::kFloat:
-      return shortest(static_cast<float>(value.toDouble()));
+      return appendShortest(text, static_cast<float>(value.toDouble()));
     case NumberKind::kDouble:
-      return shortest(value.toDouble());
+      return appendShortest(text, value.toDouble());
     case NumberKind::kBool:
     case NumberKind::kUInt8:
     case NumberKind::kUInt16:
     case NumberKind::kUInt32:
     case NumberKind::kUInt64:
-      return shortest(value.toUInt64());
+      return appendShortest(text, value.toUInt64());
     case NumberKind::kInt16:
     case NumberKind::kInt32:
     case NumberKind::kInt64:
-      return shortest(value.toInt64());
+      return appendShortest(text, value.toInt64());
   }
-  return {};
 }
 
 // Dates outside these years are printed as seconds, because they are mistakes and because the
@@ -42,11 +41,13 @@ constexpr double kEarliest = -62135596800.0;  // 0001-01-01
 constexpr double kLatest = 253402300799.0;    // 9999-12-31
 
 // Always UTC, because a log line must mean the same on every machine.
-std::string describeDate(Date date) {
+void appendDate(std::string& text, Date date) {
   using namespace std::chrono;
   const double whole = std::floor(date.secondsSince1970);
   if (!(whole >= kEarliest && whole <= kLatest)) {
-    return shortest(date.secondsSince1970) + " s since 1970";
+    appendShortest(text, date.secondsSince1970);
+    text += " s since 1970";
+    return;
   }
   const sys_seconds time{seconds{static_cast<std::int64_t>(whole)}};
   const auto day = floor<days>(time);
@@ -58,59 +59,72 @@ std::string describeDate(Date date) {
       static_cast<int>(calendar.year()), static_cast<unsigned>(calendar.month()),
       static_cast<unsigned>(calendar.day()), static_cast<int>(clock.hours().count()),
       static_cast<int>(clock.minutes().count()), static_cast<int>(clock.seconds().count()));
-  return {buffer.data(), static_cast<std::size_t>(length)};
+  text.append(buffer.data(), static_cast<std::size_t>(length));
 }
 
-std::string describeData(const Data& data) {
+void appendData(std::string& text, const Data& data) {
   constexpr std::string_view kDigits = "0123456789abcdef";
-  std::string text = "<";
+  text += '<';
   for (const std::byte byte : data.bytes()) {
     text += kDigits[std::to_integer<unsigned>(byte) >> 4U];
     text += kDigits[std::to_integer<unsigned>(byte) & 15U];
   }
-  return text + ">";
+  text += '>';
 }
 
-std::string describeArray(const Array& array) {
-  std::string text = "(";
+void appendArray(std::string& text, const Array& array) {
+  text += '(';
   for (const Value& value : array) {
     if (&value != array.begin()) text += ", ";
-    text += describe(value);
+    appendDescription(text, value);
   }
-  return text + ")";
+  text += ')';
+}
+
+void appendDictionary(std::string& text, const Dictionary& dictionary) {
+  text += '{';
+  for (const Dictionary::Entry& entry : dictionary) {
+    if (&entry != dictionary.begin()) text += "; ";
+    text += entry.key.text();
+    text += " = ";
+    appendDescription(text, entry.value);
+  }
+  text += '}';
 }
 
 }  // namespace
 
-std::string describe(const Value& value) {
+void appendDescription(std::string& text, const Value& value) {
   switch (value.kind()) {
     case ValueKind::kNone:
-      return "(null)";
+      text += "(null)";
+      return;
     case ValueKind::kNumber:
-      return describeNumber(value);
+      return appendNumber(text, value);
     case ValueKind::kString:
-      return std::string(value.string());
+      text += value.string();
+      return;
     case ValueKind::kDate:
-      return describeDate(value.date());
+      return appendDate(text, value.date());
     case ValueKind::kData:
-      return describeData(value.data());
+      return appendData(text, value.data());
     case ValueKind::kArray:
-      return describeArray(value.array());
+      return appendArray(text, value.array());
     case ValueKind::kDictionary:
-      return describe(value.dictionary());
+      return appendDictionary(text, value.dictionary());
   }
-  return {};
+}
+
+std::string describe(const Value& value) {
+  std::string text;
+  appendDescription(text, value);
+  return text;
 }
 
 std::string describe(const Dictionary& dictionary) {
-  std::string text = "{";
-  for (const Dictionary::Entry& entry : dictionary) {
-    if (text.size() > 1) text += "; ";
-    text += entry.key.text();
-    text += " = ";
-    text += describe(entry.value);
-  }
-  return text + "}";
+  std::string text;
+  appendDictionary(text, dictionary);
+  return text;
 }
 
 std::string describe(const Message& message) {

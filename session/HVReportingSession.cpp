@@ -21,6 +21,20 @@ using platform::Message;
 constexpr AudioEventCategory kSummaryCategory{0xFFFFFFFF};
 constexpr AudioEventType kSummaryType = AudioEventType::kUnknown;
 
+Dictionary taggedMessage(const Message& message, AudioEventCategory category, AudioEventType type) {
+  return HVReportingUtilityAddAudioMessageTag(
+      HVReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(Dictionary())), category, type);
+}
+
+LateContent contentOf(const std::shared_ptr<const LateSummary>& summary) {
+  const auto make = [summary]() -> LinkContent {
+    Message event = summary->makeEvent();
+    Dictionary tagged = taggedMessage(event, kSummaryCategory, kSummaryType);
+    return {.original = std::move(event), .tagged = std::move(tagged)};
+  };
+  return {.make = make, .memorySize = summary->memorySize()};
+}
+
 }  // namespace
 
 HVReportingSession::HVReportingSession(ReporterID reporterID, ProcessIdentifiers processIdentifiers,
@@ -97,9 +111,7 @@ void HVReportingSession::stop() {
   // Queued after the messages above, which must reach the link before its flush.
   if (tlmReportingEnabled()) link_.submitStop(shared_from_this());
   tracing_.stop();
-  // The history is destroyed at the end of this function, without its lock, because destroying a
-  // long history takes long.
-  const std::optional<MessageHistory> history = history_.end();
+  static_cast<void>(history_.end());
   // Cleared last, because the messages that this stop sends count as messages of a started session.
   started_.store(false, std::memory_order_release);
 }
@@ -115,11 +127,25 @@ void HVReportingSession::sendVolumeMessages() {
 
 // Sends the summary event through the session only. Unlike a volume message, the event does not go
 // to the analytics service; this is required.
+//
+// This does what sendMessage() does, with two differences that nobody can observe. The job of the
+// link makes the content of the event, because for a history of millions of messages that takes
+// seconds, in which all clients would wait. The event is not added to the history, which nothing
+// reads from here on and which is empty until the end of the stop. The event never repeats a
+// message of the history: it has a text that is longer than that of any message with the same keys.
 void HVReportingSession::sendSummaryEvent() {
-  const Message summary = summary_.createEvent();
-  if (!summary.has_value()) return;
+  const auto summary = summary_.takeHistory();
+  if (summary == nullptr) return;
   kSessionLog.notice("sending summary event for reporter ", number(reporterID()));
-  sendMessage(summary, kSummaryCategory, kSummaryType, true, nullptr);
+  kSessionLog.debug("sending message for session owned by ", number(reporterID()));
+  count(SessionHistory::Outcome::kRecorded);
+  emitTracePoint(ReportingTracePoint::kMessageSent);
+  if (!tlmReportingEnabled()) return;
+  link_.submit(shared_from_this(), {.late = contentOf(summary),
+                                    .category = kSummaryCategory,
+                                    .type = kSummaryType,
+                                    .wasStarted = started(),
+                                    .sender = held_.account()});
 }
 
 std::vector<Dictionary> HVReportingSession::createVolumeMessages(const MessageHistory& history,
@@ -137,8 +163,7 @@ void HVReportingSession::sendMessage(const Message& message, AudioEventCategory 
                                      AudioEventType type, bool /*sync*/, const ErrorReply& reply,
                                      const Account& sender) {
   kSessionLog.debug("sending message for session owned by ", number(reporterID()));
-  const Dictionary tagged = HVReportingUtilityAddAudioMessageTag(
-      HVReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(Dictionary())), category, type);
+  const Dictionary tagged = taggedMessage(message, category, type);
   const SessionHistory::Outcome outcome = history_.record(category, type, tagged);
   count(outcome);
   emitTracePoint(ReportingTracePoint::kMessageSent);
@@ -147,8 +172,7 @@ void HVReportingSession::sendMessage(const Message& message, AudioEventCategory 
   // required.
   const bool wasStarted = started();
   if (tlmReportingEnabled()) {
-    LinkMessage linkMessage{.original = message,
-                            .tagged = tagged,
+    LinkMessage linkMessage{.content = {.original = message, .tagged = tagged},
                             .category = category,
                             .type = type,
                             .wasStarted = wasStarted,

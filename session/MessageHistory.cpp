@@ -132,7 +132,7 @@ void MessageHistory::setNewest(Base& base, Dictionary message) {
   base.newest_ = std::move(message);
 }
 
-void MessageHistory::append(Base& base, Dictionary message) {
+std::optional<std::uint32_t> MessageHistory::append(Base& base, Dictionary message) {
   std::vector<std::byte>& bytes = bytes_.last();
   if (base.lost_ > 0) {
     CompactWriter writer(bytes);
@@ -146,13 +146,14 @@ void MessageHistory::append(Base& base, Dictionary message) {
     if (base.newestSize_ > 0) setNewest(base, Dictionary());
     base.isNewestInForm_ = true;
     writeForm(*form, std::move(message));
-    return;
+    return form;
   }
   CompactWriter writer(bytes);
   writer.append(kSingle);
   writer.append(std::uint64_t{base.number_});
   writer.append(message);
   setNewest(base, std::move(message));
+  return std::nullopt;
 }
 
 void MessageHistory::lose(Base& base, Dictionary message) {
@@ -262,6 +263,7 @@ bool MessageHistory::Reader::read(CompactReader& reader) {
     return false;
   }
   single_ = reader.dictionary();
+  entry_.form_.reset();
   setEntry(base, single_);
   return true;
 }
@@ -280,6 +282,8 @@ void MessageHistory::Reader::readForm(CompactReader& reader, std::size_t number)
     if ((mask[position / kBitsOfByte] & bit) == std::byte{0}) continue;
     message.setAt(position, reader.value(message.begin()[position].value));
   }
+  entry_.form_ = static_cast<std::uint32_t>(number);
+  entry_.changes_ = mask;
   setEntry(*form.base, message);
 }
 

@@ -59,12 +59,23 @@ class MessageHistory {
    public:
     [[nodiscard]] std::string identifier() const;
     [[nodiscard]] const platform::Dictionary& message() const { return *message_; }
+    // The number of the message's form, if it has one.
+    [[nodiscard]] std::optional<std::uint32_t> form() const { return form_; }
+    // Only for a message with a form: false if the value at this position is the same as in the
+    // previous message of the form.
+    [[nodiscard]] bool isChanged(std::size_t position) const {
+      return (changes_[position / kPositionsOfByte] >> (position % kPositionsOfByte) &
+              std::byte{1}) != std::byte{0};
+    }
 
    private:
     friend class MessageHistory;
+    static constexpr std::size_t kPositionsOfByte = 8;
     const Base* base_ = nullptr;  // owned by the history
     std::uint64_t count_ = 0;
     const platform::Dictionary* message_ = nullptr;  // owned by the reader
+    std::optional<std::uint32_t> form_;
+    std::span<const std::byte> changes_;  // a bit for each key; owned by the reader or the history
   };
 
   // Reads the messages of a history from the first one on, including messages that are added during
@@ -122,8 +133,9 @@ class MessageHistory {
   // The newest message of a base, or null if there is none. Valid until the next append() or
   // lose().
   [[nodiscard]] const platform::Dictionary* newestMessage(const Base& base) const;
-  // Adds a message under the next identifier of the base.
-  void append(Base& base, platform::Dictionary message);
+  // Adds a message under the next identifier of the base. Returns the number of its form, if it has
+  // one: messages with the same number have the same keys in the same order.
+  std::optional<std::uint32_t> append(Base& base, platform::Dictionary message);
   // Does not keep the message, because there is no room. Counts it under the next identifier of the
   // base. The next message of the base is compared with it.
   void lose(Base& base, platform::Dictionary message);

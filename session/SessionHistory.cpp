@@ -26,16 +26,43 @@ bool isExemptFromSuppression(AudioEventCategory category, AudioEventType type) {
 
 void SessionHistory::begin() {
   std::optional<MessageHistory> previous(std::in_place);  // destroyed without the lock
+  auto volumes = std::make_unique<VolumeHistory>();
   const Lock history = lock();
   history->swap(previous);
+  volumes_.swap(volumes);
   nextTry_ = {};
 }
 
 std::optional<MessageHistory> SessionHistory::end() {
-  std::optional<MessageHistory> history = history_.take();
+  std::optional<MessageHistory> ended;
+  std::unique_ptr<VolumeHistory> volumes;  // destroyed without the lock
+  const Lock history = lock();
+  if (!history->has_value()) return ended;
   // The charge is removed here, because the history itself does not know the account.
-  held_.change(history.has_value() ? history->memorySize() : 0, 0);
-  return history;
+  held_.change(memorySize(**history), 0);
+  volumes.swap(volumes_);
+  ended.swap(*history);
+  return ended;
+}
+
+std::optional<MessageHistory> SessionHistory::take() {
+  std::optional<MessageHistory> taken;
+  const Lock history = lock();
+  if (!history->has_value()) return taken;
+  const std::size_t before = memorySize(**history);
+  taken.emplace();
+  taken.swap(*history);
+  held_.change(before, memorySize(**history));
+  return taken;
+}
+
+std::unique_ptr<const MessageHistory> SessionHistory::takeVolumeMessages() {
+  const Lock history = lock();
+  if (!history->has_value()) return nullptr;
+  const std::size_t before = memorySize(**history);
+  auto messages = volumes_->take();
+  held_.change(before, memorySize(**history));
+  return messages;
 }
 
 std::size_t SessionHistory::size() const {
@@ -49,7 +76,7 @@ SessionHistory::Outcome SessionHistory::recordLocked(const Lock& history,
                                                      const platform::Dictionary& message) {
   if (!history->has_value()) return Outcome::kNotStarted;
   MessageHistory& messages = **history;
-  const std::size_t before = messages.memorySize();
+  const std::size_t before = memorySize(messages);
   MessageHistory::Base& base = messages.base(category, type);
   // Only the newest message of the same category and type is compared, however old it is. Of the
   // messages A, B, A all three are recorded, and two equal messages an hour apart are a repetition.
@@ -61,20 +88,20 @@ SessionHistory::Outcome SessionHistory::recordLocked(const Lock& history,
     kSessionLog.debug("dropping redundant event");
     outcome = Outcome::kRedundant;
   } else if (makeRoom(messages)) {
-    messages.append(base, message);
+    volumes_->add(message, messages.append(base, message));
   } else {
     messages.lose(base, message);
     outcome = Outcome::kNoRoom;
   }
   // Called even if nothing was recorded, because the table of codes may have grown.
-  held_.change(before, messages.memorySize());
+  held_.change(before, memorySize(messages));
   return outcome;
 }
 
 // When a history takes much memory, it goes on in a file. It loses a message only if writing the
 // file fails, for instance because the disk is full.
 bool SessionHistory::makeRoom(MessageHistory& messages) {
-  const std::size_t movable = messages.movableSize();
+  const std::size_t movable = messages.movableSize() + volumes_->movableSize();
   if (movable < kLeastToMove) return true;
   if (movable < kMostInMemory && !isClientOverItsShare()) return true;
   return tryToMoveOut(messages);
@@ -85,7 +112,8 @@ bool SessionHistory::makeRoom(MessageHistory& messages) {
 bool SessionHistory::tryToMoveOut(MessageHistory& messages) {
   const std::chrono::milliseconds now = platform::clock().processUptime();
   if (now < nextTry_) return false;
-  const auto error = messages.moveOut();
+  auto error = messages.moveOut();
+  if (!error.has_value() && volumes_->movableSize() >= kLeastToMove) error = volumes_->moveOut();
   if (!error.has_value()) return true;
   nextTry_ = now + kRetryTime;
   if (messages.lost() == 0) {

@@ -3,6 +3,7 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <optional>
 
 #include "backends/HVReportingVocabulary.h"
@@ -10,6 +11,7 @@
 #include "session/Guarded.h"
 #include "session/MessageHistory.h"
 #include "session/ResourceAccount.h"
+#include "session/VolumeHistory.h"
 
 namespace halvox {
 
@@ -20,8 +22,10 @@ namespace halvox {
 // disk is full, it loses messages until there is room again. It tries again at most four times a
 // second, and logs the first loss of a run.
 //
+// The volume messages of the run are made as messages are recorded; a stop takes them.
+//
 // Owned by the session. Any thread may call; the history has one lock, which also guards the
-// counts of its identifiers.
+// counts of its identifiers and the volume messages.
 class SessionHistory {
  public:
   // The history, locked. Holds none outside a run.
@@ -41,6 +45,12 @@ class SessionHistory {
   // too long to do under the lock.
   [[nodiscard]] std::optional<MessageHistory> end();
 
+  // Returns the history so far, and leaves an empty one until the end of the run; none outside a
+  // run.
+  [[nodiscard]] std::optional<MessageHistory> take();
+  // Returns the volume messages of the messages so far, in order; null if there are none.
+  [[nodiscard]] std::unique_ptr<const MessageHistory> takeVolumeMessages();
+
   [[nodiscard]] Lock lock() const { return history_.lock(); }
   // Number of recorded messages; 0 outside a run.
   [[nodiscard]] std::size_t size() const;
@@ -56,7 +66,10 @@ class SessionHistory {
                        const platform::Dictionary& message);
 
  private:
-  // makeRoom() and tryToMoveOut() are called with the history locked.
+  // memorySize(), makeRoom() and tryToMoveOut() are called with the history locked.
+  [[nodiscard]] std::size_t memorySize(const MessageHistory& messages) const {
+    return messages.memorySize() + volumes_->memorySize();
+  }
   [[nodiscard]] bool makeRoom(MessageHistory& messages);
   [[nodiscard]] bool tryToMoveOut(MessageHistory& messages);
   [[nodiscard]] bool isClientOverItsShare() const;
@@ -64,8 +77,9 @@ class SessionHistory {
   const ReporterID reporterID_;
   ResourceTally& held_;  // the session's
   Guarded<std::optional<MessageHistory>> history_;
-  // When to try again after a failure, in the process's uptime. Guarded by the lock of history_.
-  std::chrono::milliseconds nextTry_{0};
+  // The lock of history_ guards both.
+  std::unique_ptr<VolumeHistory> volumes_;  // null outside a run
+  std::chrono::milliseconds nextTry_{0};    // after a failed write, in the process's uptime
 };
 
 }  // namespace halvox

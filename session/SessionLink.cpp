@@ -33,13 +33,14 @@ bool mayUseFramework(AudioServiceType serviceType) {
 
 // What a waiting message keeps in memory.
 std::size_t bytesOf(const LinkMessage& message) {
-  std::size_t bytes = kWaitingOverhead + message.tagged.memorySize();
-  if (!message.original.has_value()) return bytes;
+  if (message.late.has_value()) return kWaitingOverhead + message.late->memorySize;
+  const auto& [original, tagged] = message.content;
+  std::size_t bytes = kWaitingOverhead + tagged.memorySize();
+  if (!original.has_value()) return bytes;
   // Normally the tagged message is the original with one more entry and shares its values. If two
   // keys became equal or the original had a tag, some values belong to the original alone.
-  const bool sharesValues = message.tagged.size() == message.original->size() + 1;
-  bytes += sharesValues ? message.original->size() * sizeof(Dictionary::Entry)
-                        : message.original->memorySize();
+  const bool sharesValues = tagged.size() == original->size() + 1;
+  bytes += sharesValues ? original->size() * sizeof(Dictionary::Entry) : original->memorySize();
   return bytes;
 }
 
@@ -192,22 +193,27 @@ void SessionLink::handle(const LinkMessage& message) {
 }
 
 void SessionLink::sendThroughFramework(const LinkMessage& message) {
-  const std::uint16_t category =
-      HVReportingUtilityRetrieveTLMReportingCategoryFromCategory(message.category);
   const auto open = tlmReportingSession();
   // The order of these tests decides under which reason a message is counted.
   if (!HVReportingUtilityAllowSessionTransactions()) return counters_.link.notAllowed.add();
   if (profile_.serviceType() == AudioServiceType::kTest) return counters_.link.testSession.add();
   if (message.isRedundant) return counters_.link.redundant.add();
   if (open == nullptr || !tlmReportingSessionStarted()) return counters_.link.noBackend.add();
+  if (message.late.has_value()) return sendContent(open, message, message.late->make());
+  sendContent(open, message, message.content);
+}
 
+void SessionLink::sendContent(const platform::TLMReportingService::Session& open,
+                              const LinkMessage& message, const LinkContent& content) {
+  const std::uint16_t category =
+      HVReportingUtilityRetrieveTLMReportingCategoryFromCategory(message.category);
   const platform::TLMReportingOutcome outcome = platform::tlmReporting().TLMReportingSendMessage(
-      open, {.category = category, .type = number(message.type), .payload = message.tagged});
+      open, {.category = category, .type = number(message.type), .payload = content.tagged});
   if (outcome.sent) {
     counters_.link.sent.add();
     // The line shows the message without its tag and the category with its domain, although the
     // framework got the tag but not the domain. All of this is required.
-    kSessionLog.debug("TLMReportingAgent ", *open, " : message ", message.original, " : category ",
+    kSessionLog.debug("TLMReportingAgent ", *open, " : message ", content.original, " : category ",
                       number(message.category), " : type ", number(message.type));
     return;
   }
@@ -222,8 +228,9 @@ void SessionLink::sendThroughFramework(const LinkMessage& message) {
 void SessionLink::sendAsSingleMessage(const LinkMessage& message) const {
   kSessionLog.debug("session not started, will send as a single message");
   counters_.link.single.add();
-  submitSingleMessage({message.tagged, message.category, message.type, profile_.serviceType()},
-                      nullptr, message.sender, counters_.single);
+  submitSingleMessage(
+      {message.content.tagged, message.category, message.type, profile_.serviceType()}, nullptr,
+      message.sender, counters_.single);
 }
 
 }  // namespace halvox

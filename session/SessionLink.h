@@ -1,6 +1,8 @@
 #pragma once
 
 #include <atomic>
+#include <cstddef>
+#include <functional>
 #include <memory>
 #include <mutex>
 #include <optional>
@@ -19,10 +21,22 @@ class HVReportingSession;
 class SessionProfile;
 struct LinkStart;
 
-// A message on its way to the link.
-struct LinkMessage {
+// What a message says.
+struct LinkContent {
   platform::Message original{};  // as the client gave it
   platform::Dictionary tagged{};
+};
+
+// The content of a message that is made only when the message is sent, if it is sent.
+struct LateContent {
+  std::function<LinkContent()> make;
+  std::size_t memorySize = 0;  // of what `make` keeps until then, in bytes
+};
+
+// A message on its way to the link.
+struct LinkMessage {
+  LinkContent content{};
+  std::optional<LateContent> late{};  // instead of `content`; only for a message of a run
   AudioEventCategory category{};
   AudioEventType type{};
   bool wasStarted = false;  // at the moment of sending
@@ -104,6 +118,8 @@ class SessionLink {
   void drop();
   void handle(const LinkMessage& message);
   void sendThroughFramework(const LinkMessage& message);
+  void sendContent(const platform::TLMReportingService::Session& open, const LinkMessage& message,
+                   const LinkContent& content);
   void sendAsSingleMessage(const LinkMessage& message) const;
   // Runs on the framework's thread or on the discovery's queue.
   void onBackendsFound(bool found);

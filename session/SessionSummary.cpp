@@ -3,6 +3,7 @@
 #include <cstdint>
 #include <optional>
 #include <string_view>
+#include <utility>
 
 #include "backends/HVReportingUtility.h"
 #include "platform/clock.h"
@@ -12,7 +13,6 @@
 #include "session/SessionProfile.h"
 #include "session/SummaryEvent.h"
 #include "session/SummaryFileName.h"
-#include "session/VolumeMessages.h"
 
 namespace halvox {
 namespace {
@@ -26,33 +26,48 @@ constexpr std::string_view kDirectory =
 // of the storage root.
 constexpr std::uint32_t kDirectoryPermissions = 0777;
 
+void logIfCutShort(const MessageHistory::Reader& reader, ReporterID reporterID) {
+  if (!reader.error().has_value()) return;
+  kSessionLog.error("cannot read the rest of the history of reporter ", number(reporterID), ": ",
+                    reader.error()->description, "; the summary lacks the remaining messages");
+}
+
+platform::Dictionary makeEventOf(const MessageHistory& history, AudioServiceType serviceType,
+                                 ReporterID reporterID) {
+  SummaryEvent event(serviceType);
+  MessageHistory::Reader reader(history);
+  while (const MessageHistory::Entry* entry = reader.next()) event.add(*entry);
+  logIfCutShort(reader, reporterID);
+  return event.take();
+}
+
 }  // namespace
 
+platform::Dictionary LateSummary::makeEvent() const {
+  return makeEventOf(history_, serviceType_, reporterID_);
+}
+
+// Logged once, before the first message, and only if there is one.
 void SessionSummary::sendVolumeMessages(const Send& send) const {
-  std::optional<VolumeWalk> walk;
-  const auto next = [&walk, this]() -> Message {
-    const SessionHistory::Lock history = history_.lock();
-    if (!history->has_value()) return std::nullopt;
-    if (!walk.has_value()) {
-      walk.emplace(HVReportingUtilityVolumeMinimumPlayingTime(profile_.serviceType()), **history);
-    }
-    return walk->next();
-  };
-  // The line is logged once, before the first message, and only if there is a message.
-  Message message = next();
-  if (!message.has_value()) return;
+  const auto messages = history_.takeVolumeMessages();
+  if (messages == nullptr) return;
   kSessionLog.notice("sending volume event for reporter ", number(profile_.reporterID()));
-  for (; message.has_value(); message = next()) send(message);
+  MessageHistory::Reader reader(*messages);
+  while (const MessageHistory::Entry* entry = reader.next()) send(entry->message());
+  logIfCutShort(reader, profile_.reporterID());
 }
 
 Message SessionSummary::createEvent() const {
   const SessionHistory::Lock history = history_.lock();
   if (!history->has_value() || (*history)->empty()) return std::nullopt;
-  SummaryEvent event(profile_.serviceType());
-  MessageHistory::Reader reader(**history);
-  while (const MessageHistory::Entry* entry = reader.next()) event.add(entry->message());
-  logIfCutShort(reader);
-  return event.take();
+  return makeEventOf(**history, profile_.serviceType(), profile_.reporterID());
+}
+
+std::shared_ptr<const LateSummary> SessionSummary::takeHistory() const {
+  std::optional<MessageHistory> history = history_.take();
+  if (!history.has_value() || history->empty()) return nullptr;
+  return std::make_shared<const LateSummary>(profile_.serviceType(), profile_.reporterID(),
+                                             std::move(*history));
 }
 
 // Writes the text piece by piece, because a long history and its whole text may not fit into memory
@@ -76,7 +91,7 @@ void SessionSummary::writeFile() const {
     while (const MessageHistory::Entry* entry = reader.next()) {
       file->appendObject(entry->identifier(), entry->message());
     }
-    logIfCutShort(reader);
+    logIfCutShort(reader, profile_.reporterID());
   }
   std::string path;
   if (const auto error = file->commit(path)) {
@@ -84,13 +99,6 @@ void SessionSummary::writeFile() const {
   } else {
     kSessionLog.info("jsonOutput writeToURL: ", path);
   }
-}
-
-void SessionSummary::logIfCutShort(const MessageHistory::Reader& reader) const {
-  if (!reader.error().has_value()) return;
-  kSessionLog.error("cannot read the rest of the history of reporter ",
-                    number(profile_.reporterID()), ": ", reader.error()->description,
-                    "; the summary lacks the remaining messages");
 }
 
 std::string SessionSummary::fileName() const {

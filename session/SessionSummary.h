@@ -1,8 +1,12 @@
 #pragma once
 
+#include <cstddef>
 #include <functional>
+#include <memory>
 #include <string>
+#include <utility>
 
+#include "backends/HVReportingVocabulary.h"
 #include "platform/value.h"
 #include "session/MessageHistory.h"
 #include "session/SessionHistory.h"
@@ -11,34 +15,60 @@ namespace halvox {
 
 class SessionProfile;
 
+// The summary event of a run that has ended, made when it is sent. Immutable; shared by the copies
+// of the job that sends it. Gives the memory and the file of the history back when it is destroyed.
+class LateSummary {
+ public:
+  LateSummary(AudioServiceType serviceType, ReporterID reporterID, MessageHistory history)
+      : serviceType_(serviceType), reporterID_(reporterID), history_(std::move(history)) {}
+
+  // Takes time, and memory for the texts, in proportion to the history. Logs what it cannot read.
+  [[nodiscard]] platform::Dictionary makeEvent() const;
+  // What it keeps in memory.
+  [[nodiscard]] std::size_t memorySize() const { return history_.memorySize(); }
+
+ private:
+  const AudioServiceType serviceType_;
+  const ReporterID reporterID_;
+  const MessageHistory history_;
+};
+
 // What a session reports about its run when it stops: how long was played at which volume, every
 // value that every key had, and on internal builds a file with the whole history.
 //
-// Owned by the session, on the thread that stops it. Takes time in proportion to the history; each
-// operation locks the history only while it reads it.
+// The requests of all clients wait for a stop. What it reports is therefore made elsewhere where
+// that makes no difference to a client: volume messages while messages are recorded, and the event
+// by the job that sends it. The file is written by the stop itself, because clients may rely on it
+// after the answer.
+//
+// Owned by the session, on the thread that stops it. Each operation locks the history only while it
+// reads it.
 class SessionSummary {
  public:
   using Send = std::function<void(const platform::Message&)>;
 
   // Both must outlive this.
-  SessionSummary(const SessionProfile& profile, const SessionHistory& history)
+  SessionSummary(const SessionProfile& profile, SessionHistory& history)
       : profile_(profile), history_(history) {}
 
-  // Passes each volume message to `send` as soon as it is found. The messages of a long history are
-  // many and are not collected first; `send` may add to the history.
+  // Passes the volume messages to `send`, each as soon as it is read; `send` may add to the
+  // history.
   void sendVolumeMessages(const Send& send) const;
-  // The summary event; none if the history is empty or the session is not started.
+  // The summary event; none if the history is empty or the session is not started. Takes time in
+  // proportion to the history.
   [[nodiscard]] platform::Message createEvent() const;
+  // Takes the history of the run and returns what makes the same event from it later, on any
+  // thread; null if there is no event. The service type is that of this moment.
+  [[nodiscard]] std::shared_ptr<const LateSummary> takeHistory() const;
   // On internal builds, writes the history into a JSON file, unless it is empty. Logs failures.
   // Waits for the disk.
   void writeFile() const;
 
  private:
-  void logIfCutShort(const MessageHistory::Reader& reader) const;
   [[nodiscard]] std::string fileName() const;
 
   const SessionProfile& profile_;  // the session's
-  const SessionHistory& history_;  // the session's
+  SessionHistory& history_;        // the session's
 };
 
 }  // namespace halvox

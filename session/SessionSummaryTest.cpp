@@ -1,5 +1,6 @@
 #include <algorithm>
 #include <memory>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -18,7 +19,25 @@ using platform::Value;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-class SessionSummaryTest : public SummaryFixture {};
+class SessionSummaryTest : public SummaryFixture {
+ protected:
+  static constexpr int kLongMessages = 1500;
+
+  void restartWithLink(const std::optional<platform::Array>& backends) {
+    session_->stop();
+    session_->setTlmReportingEnabled(true);
+    platform_.tlmReporting.answerDiscoveries(platform::FakeTlmReportingService::Answering::kLater,
+                                             backends);
+    session_->start();
+  }
+  // So many that their history goes on outside memory.
+  void sendManyLongMessages() {
+    std::string text(1000, 'x');
+    for (int number = 0; number < kLongMessages; ++number) {
+      send({{"foo", std::to_string(number) + text}});
+    }
+  }
+};
 
 // --- the summary event --------------------------------------------------------------------------
 
@@ -238,6 +257,85 @@ TEST_F(SessionSummaryTest, TheSummaryHasAllBitsOfItsCategoryAndTypeSet) {
       std::ranges::count_if(
           lines, [](const auto& text) { return text.ends_with(" : category -1 : type 65535"); }),
       1);
+}
+
+// All clients wait for a stop, and making the event of a long history takes long.
+TEST_F(SessionSummaryTest, TheLinksJobMakesTheEventAndReleasesTheHistory) {
+  restartWithLink(platform::Array{"server"});
+  sendManyLongMessages();
+
+  session_->stop();
+  EXPECT_FALSE(session_->started());
+  EXPECT_GT(platform_.overflow.keptBytes(), 0U);
+  platform_.dispatch.runUntilIdle();
+
+  EXPECT_EQ(platform_.overflow.keptBytes(), 0U);
+  const Dictionary summary = platform_.tlmReporting.messages().back().payload;
+  EXPECT_EQ(std::ranges::count(summary.find("foo")->string(), ','), kLongMessages - 1);
+}
+
+TEST_F(SessionSummaryTest, ARunThatBeginsMeanwhileHasNoPartInTheEvent) {
+  restartWithLink(platform::Array{"server"});
+  send({{"foo", 1}});
+  session_->stop();
+
+  session_->setServiceType(AudioServiceType::kAlarms);
+  session_->start();
+  send({{"foo", 2}});
+  platform_.dispatch.runUntilIdle();
+
+  const Dictionary summary = platform_.tlmReporting.messages().at(1).payload;
+  EXPECT_EQ(*summary.find("foo"), Value("1"));
+  EXPECT_EQ(*summary.find("HV_Session_Summary_Event"), Value("3"));
+}
+
+TEST_F(SessionSummaryTest, WithoutALinkNoEventIsMade) {
+  sendManyLongMessages();
+  platform_.overflow.setReadError(platform::Error{.description = "bad block"});
+
+  session_->stop();
+
+  EXPECT_EQ(platform_.overflow.keptBytes(), 0U);
+  EXPECT_THAT(platform_.log.texts(platform::LogLevel::kError), IsEmpty());
+}
+
+TEST_F(SessionSummaryTest, WithoutABackendNoEventIsMade) {
+  restartWithLink(std::nullopt);
+  platform_.dispatch.runUntilIdle();
+  platform_.log.clear();
+  sendManyLongMessages();
+  platform_.overflow.setReadError(platform::Error{.description = "bad block"});
+
+  session_->stop();
+  platform_.dispatch.runUntilIdle();
+
+  EXPECT_EQ(platform_.overflow.keptBytes(), 0U);
+  EXPECT_THAT(platform_.log.texts(platform::LogLevel::kError), IsEmpty());
+}
+
+TEST_F(SessionSummaryTest, AnEventOfADamagedHistorySaysSo) {
+  restartWithLink(platform::Array{"server"});
+  sendManyLongMessages();
+  platform_.overflow.setReadError(platform::Error{.description = "bad block"});
+
+  session_->stop();
+  platform_.dispatch.runUntilIdle();
+
+  EXPECT_THAT(platform_.log.texts(platform::LogLevel::kError),
+              ElementsAre("cannot read the rest of the history of reporter 7: bad block; the "
+                          "summary lacks the remaining messages"));
+}
+
+TEST_F(SessionSummaryTest, TheEventCountsAsARecordedMessage) {
+  send({{"foo", 1}});
+  const auto recorded = [this] {
+    return platform_.statistics.counter("session", "recorded").value();
+  };
+  const auto before = recorded();
+
+  session_->stop();
+
+  EXPECT_EQ(recorded(), before + 1);
 }
 
 TEST_F(SessionSummaryTest, VolumesThatNeverPlayedSendNoVolumeEvent) {

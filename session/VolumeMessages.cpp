@@ -97,22 +97,24 @@ Dictionary VolumeIntervals::makeMessage(double seconds) const {
           {kPlaySecondsBucketedKey, bucketed(seconds, secondsBuckets(), kSecondsFractionDigits)}};
 }
 
-platform::Message VolumeWalk::next() {
-  while (left_ > 0) {
-    --left_;
-    const MessageHistory::Entry* entry = reader_.next();
-    if (entry == nullptr) break;
-    platform::Message message = intervals_.add(entry->message());
-    if (message.has_value()) return message;
-  }
-  return std::nullopt;
+bool VolumeIntervals::isConcernedWith(const Dictionary& message) {
+  return message.find(kVolumeKey) != nullptr || message.find(kFormatKey) != nullptr ||
+         message.find(kDevicesKey) != nullptr || message.find(kProcessKey) != nullptr;
+}
+
+std::size_t VolumeIntervals::memorySize() const {
+  return format_.memorySize() + devices_.memorySize() + process_.memorySize();
 }
 
 std::vector<Dictionary> createVolumeMessages(const MessageHistory& history,
                                              double minimumPlaytime) {
   std::vector<Dictionary> messages;
-  VolumeWalk walk(minimumPlaytime, history);
-  while (platform::Message message = walk.next()) messages.push_back(std::move(*message));
+  VolumeIntervals intervals(minimumPlaytime);
+  MessageHistory::Reader reader(history);
+  while (const MessageHistory::Entry* entry = reader.next()) {
+    auto message = intervals.add(entry->message());
+    if (message.has_value()) messages.push_back(std::move(*message));
+  }
   return messages;
 }
 

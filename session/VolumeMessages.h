@@ -36,6 +36,10 @@ class VolumeIntervals {
   // Takes the next message of the run. Returns the volume message of the interval that this message
   // ends, if it ends one that is long enough.
   std::optional<platform::Dictionary> add(const platform::Dictionary& message);
+  // False if the message has no key that matters here: add() would do nothing.
+  [[nodiscard]] static bool isConcernedWith(const platform::Dictionary& message);
+  // The bytes on the heap that the kept values take.
+  [[nodiscard]] std::size_t memorySize() const;
 
  private:
   // The message of the interval that has just ended.
@@ -47,28 +51,6 @@ class VolumeIntervals {
   platform::Value process_{"Unknown"};
   platform::Value lastVolume_{-1};
   std::optional<double> start_;  // in seconds; none while no interval is open
-};
-
-// Finds the volume messages of a history one at a time. The history need not stay locked between
-// them. Messages that are added during the walk are ignored, because the session records each
-// volume message in the same history.
-//
-// Belongs to one thread, which holds the lock of the history during each call of next(). The
-// history must outlive it and stay where it is.
-class VolumeWalk {
- public:
-  // Walks the messages that the history has now; reports intervals longer than `minimumPlaytime`
-  // seconds.
-  VolumeWalk(double minimumPlaytime, const MessageHistory& history)
-      : intervals_(minimumPlaytime), reader_(history), left_(history.size()) {}
-
-  // The next volume message, or none at the end.
-  platform::Message next();
-
- private:
-  VolumeIntervals intervals_;
-  MessageHistory::Reader reader_;
-  std::size_t left_;  // messages to walk
 };
 
 // All volume messages of a history, in the order in which their intervals ended. Intervals of at
