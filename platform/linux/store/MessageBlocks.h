@@ -34,6 +34,8 @@ class MessageBlocks {
   [[nodiscard]] SqliteCode prepare(Database& database);
   // Finalizes all statements, before each closing of the database.
   void release();
+  // Frees what only frequent writing needs. Do not call inside a transaction.
+  void releaseMemory() { writer_.release(); }
 
   // Begins to write a transaction of about `records` records.
   [[nodiscard]] SqliteCode begin(std::uint64_t records);

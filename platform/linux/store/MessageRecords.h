@@ -54,6 +54,11 @@ class MessageRecords final : public RecordKind {
   [[nodiscard]] SqliteCode write(TransactionAllowance& allowance) override;
   void onCommitted(FinishedRecords& finished) override;
   std::uint64_t dropTaken(DropReason reason, FinishedRecords& finished) override;
+  // Frees what only a busy store needs, when no taken record waits.
+  void releaseMemory() {
+    std::vector<Record>().swap(taken_);
+    blocks_.releaseMemory();
+  }
   [[nodiscard]] SqliteCode oldestTime(std::optional<double>& time) override {
     return blocks_.oldestTime(time);
   }

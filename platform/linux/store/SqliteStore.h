@@ -109,6 +109,7 @@ class SqliteStore {
   void drop(DropReason reason, std::string_view what);
   void onStored();
   void maintainWhileIdle();
+  void releaseMemoryIfIdle();
   [[nodiscard]] bool maintainOnce();
   void closeDatabase();
   void abandonDatabase();
@@ -136,6 +137,7 @@ class SqliteStore {
   Retention retention_;
   Time nextRound_{};
   std::uint64_t droppedSinceStored_ = 0;
+  std::uint64_t bytesSinceRelease_ = 0;  // of payloads, since memory was last released
   OncePerSecond failureLines_;
 
   StoreExtent extent_;  // the newest records at the time when the database was opened

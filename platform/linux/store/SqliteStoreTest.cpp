@@ -98,6 +98,26 @@ TEST_F(SqliteStoreTest, KeepsTheOrderOfManyEventsOfOneThread) {
   }
 }
 
+// The store releases memory after every 4 MiB of payloads and must be able to continue.
+TEST_F(SqliteStoreTest, ContinuesAfterItHasReleasedMemory) {
+  constexpr int kRounds = 3;
+  constexpr int kEventsOfRound = 5000;
+  start();
+  const std::string text(1000, 't');
+
+  for (int round = 0; round < kRounds; ++round) {
+    for (int number = 0; number < kEventsOfRound; ++number) {
+      service->sendAnalyticsEventLazy("com.tarno.test", [text, number] {
+        return Dictionary{{"number", number}, {"text", text}};
+      });
+    }
+    ASSERT_TRUE(allIsStored());
+  }
+
+  EXPECT_EQ(rows(database(), "SELECT count(*) FROM analytics_events"),
+            (std::vector<std::string>{std::to_string(kRounds * kEventsOfRound)}));
+}
+
 TEST_F(SqliteStoreTest, KeepsTheOrderOfEachOfSeveralThreads) {
   constexpr std::int64_t kEvents = 3000;
   start();
