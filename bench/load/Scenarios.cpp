@@ -7,6 +7,8 @@
 #include <memory>
 #include <thread>
 
+#include <sys/resource.h>
+
 #include "bench/load/Server.h"
 
 namespace halvox::bench {
@@ -85,6 +87,35 @@ double serverMicrosAfter(const LoadOptions& options,
   client->pipeline(5000, options.window, options.shape);
   prepare(server, *client);
   return pipelineCost(server, *client, options, options.messages / 2).serverMicros;
+}
+
+// The cost of a message when all of the clients send at once.
+double serverMicrosOfMany(const LoadOptions& options, int count) {
+  const Server server(options.programs, ServerKind::kUnwanted);
+  std::vector<std::unique_ptr<LoadClient>> clients;
+  for (int number = 0; number < count; ++number) {
+    clients.push_back(server.client(1 + number));
+    clients.back()->pipeline(5000 / count + 1, options.window, options.shape);
+  }
+  const std::int64_t each = options.messages / 2 / count;
+  const auto before = server.process().settledCpuTime();
+  std::vector<std::thread> busy;
+  for (const auto& client : clients) {
+    busy.emplace_back([&options, each, sender = client.get()] {
+      sender->pipeline(each, options.window, options.shape);
+    });
+  }
+  for (std::thread& thread : busy) thread.join();
+  const auto cpu = server.process().settledCpuTime() - before;
+  return micros(cpu) / static_cast<double>(each * count);
+}
+
+// Each connection takes a descriptor here and one in the service, which inherits the limit.
+void allowManyDescriptors() {
+  rlimit limit{};
+  ::getrlimit(RLIMIT_NOFILE, &limit);
+  limit.rlim_cur = limit.rlim_max;
+  ::setrlimit(RLIMIT_NOFILE, &limit);
 }
 
 }  // namespace
@@ -187,29 +218,39 @@ void measureMemory(const LoadOptions& options, std::vector<Measurement>& results
 }
 
 void measureGrowth(const LoadOptions& options, std::vector<Measurement>& results) {
-  constexpr std::int64_t kSessions = 10'000;
-  constexpr int kClients = 1000;
-  constexpr std::int64_t kHistory = 1'000'000;
-  const double alone = serverMicrosAfter(options, [](const Server&, LoadClient&) {});
-  const auto add = [&](const std::string& name, double value) {
-    results.push_back(
-        {"service CPU " + name + ", times that with one", "x", value / alone, {}, 1.2, {}});
-  };
-  add("with 10,000 sessions", serverMicrosAfter(options, [](const Server&, LoadClient& client) {
-        client.createSessions(1000, kSessions);
-      }));
+  allowManyDescriptors();
+  // First and last, because the speed of a shared machine changes meanwhile.
+  const auto alone = [&] { return serverMicrosAfter(options, [](const Server&, LoadClient&) {}); };
+  const double first = alone();
+  const double sessions = serverMicrosAfter(options, [&options](const Server&, LoadClient& client) {
+    client.createSessions(1000, options.sessions);
+  });
   std::vector<std::unique_ptr<LoadClient>> idle;
-  add("with 1,000 clients", serverMicrosAfter(options, [&idle](const Server& server, LoadClient&) {
-        for (int number = 0; number < kClients; ++number) {
-          idle.push_back(server.client(10'000 + number));
-        }
-      }));
-  // Otherwise their connections would count in the next measurement.
+  const double connections = serverMicrosAfter(options, [&](const Server& server, LoadClient&) {
+    for (int number = 0; number < options.idleConnections; ++number) {
+      idle.push_back(server.idleClient());
+    }
+  });
+  // Their connections would count in the next measurement.
   idle.clear();
-  add("with 1,000,000 messages of history",
-      serverMicrosAfter(options, [&options](const Server&, LoadClient& client) {
-        client.pipeline(kHistory, options.window, options.shape);
-      }));
+  const double history = serverMicrosAfter(options, [&options](const Server&, LoadClient& client) {
+    client.pipeline(options.history, options.window, options.shape);
+  });
+  const double busy = serverMicrosOfMany(options, options.busyClients);
+  const double one = (first + alone()) / 2;
+  const auto add = [&](std::int64_t count, const char* what, double value) {
+    results.push_back({"service CPU with " + std::to_string(count) + what + ", times that with one",
+                       "x",
+                       value / one,
+                       {},
+                       1.1,
+                       {}});
+  };
+  results.push_back({"service CPU with one client", "us/message", one, {}, {}, {}});
+  add(options.sessions, " sessions", sessions);
+  add(options.idleConnections, " idle connections", connections);
+  add(options.history, " messages of history", history);
+  add(options.busyClients, " busy clients", busy);
 }
 
 void measureIdle(const LoadOptions& options, std::vector<Measurement>& results) {

@@ -15,6 +15,11 @@ struct LoadOptions {
   std::int64_t window = 64;
   int clients = 4;  // the number of clients for memory and latency under load
   int rounds = 3;   // of throughput; in each round echo and service take turns
+  // What grows in the scenario of growth.
+  std::int64_t sessions = 10'000;
+  int idleConnections = 1000;
+  int busyClients = 64;
+  std::int64_t history = 1'000'000;  // messages; also of the session that is stopped
   MessageShape shape;
 };
 

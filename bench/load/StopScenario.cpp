@@ -14,7 +14,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr std::int64_t kHistory = 1'000'000;
 constexpr std::chrono::milliseconds kAskEvery{10};
 
 double secondsSince(Clock::time_point begin) {
@@ -63,7 +62,7 @@ struct Build {
 void measure(const LoadOptions& options, const Build& build, std::vector<Measurement>& results) {
   const Server server(options.programs, ServerKind::kStored, build.settings);
   const auto client = server.client(1);
-  client->pipeline(kHistory, options.window, options.shape);
+  client->pipeline(options.history, options.window, options.shape);
   // The service still stores what it has answered; that work does not belong to the stop.
   server.process().waitForRest();
   const long before = server.process().residentKib();
@@ -77,6 +76,7 @@ void measure(const LoadOptions& options, const Build& build, std::vector<Measure
   const std::chrono::duration<double> cpu = server.process().cpuTime() - cpuBefore;
   server.process().waitForRest();
   const double atRest = secondsSince(begin);
+  const std::chrono::duration<double> cpuAtRest = server.process().cpuTime() - cpuBefore;
   const std::vector<double> waits = other.end();
 
   const auto add = [&](const char* what, const char* unit, double value,
@@ -86,9 +86,12 @@ void measure(const LoadOptions& options, const Build& build, std::vector<Measure
   add("answer to the stop", "s", seconds, 5.0);
   add("CPU time of the service until then", "s", cpu.count(), {});
   add("until the service is idle again", "s", atRest, {});
-  add("longest wait of another client", "s", *std::ranges::max_element(waits), {});
+  add("CPU time of the service until it is", "s", cpuAtRest.count(), {});
+  add("longest wait of another client", "s", *std::ranges::max_element(waits), 0.05);
   add("median wait of another client", "us", median(waits) * 1e6, {});
   add("resident memory before", "MiB", static_cast<double>(before) / 1024, {});
+  add("resident memory after it", "MiB", static_cast<double>(server.process().residentKib()) / 1024,
+      {});
   // The texts of the summary event contain each value of the history.
   add("peak resident memory", "MiB", static_cast<double>(server.process().peakKib()) / 1024, 512.0);
 }
@@ -96,8 +99,9 @@ void measure(const LoadOptions& options, const Build& build, std::vector<Measure
 }  // namespace
 
 void measureStop(const LoadOptions& options, std::vector<Measurement>& results) {
-  measure(options, {"stop of 1,000,000 messages, no link", kNoLink}, results);
-  measure(options, {"stop of 1,000,000 messages", kLocalLink}, results);
+  const std::string what = "stop of " + std::to_string(options.history) + " messages";
+  measure(options, {what + ", no link", kNoLink}, results);
+  measure(options, {what, kLocalLink}, results);
   measure(options,
           {"the same on an internal build",
            std::string(kLocalLink) + "[device]\nInternalBuild = true\n"},

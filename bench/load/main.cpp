@@ -57,6 +57,18 @@ int run(int argc, char** argv) {
   app.add_option("--rounds", options.rounds, "Rounds of throughput; the result is the median")
       ->capture_default_str()
       ->check(CLI::PositiveNumber);
+  app.add_option("--sessions", options.sessions, "Sessions for growth")
+      ->capture_default_str()
+      ->check(CLI::PositiveNumber);
+  app.add_option("--idle-connections", options.idleConnections, "Idle connections for growth")
+      ->capture_default_str()
+      ->check(CLI::PositiveNumber);
+  app.add_option("--busy-clients", options.busyClients, "Clients that send at once, for growth")
+      ->capture_default_str()
+      ->check(CLI::PositiveNumber);
+  app.add_option("--history", options.history, "Messages of history for growth and stop")
+      ->capture_default_str()
+      ->check(CLI::PositiveNumber);
   app.add_option("--fields", options.shape.fields, "Fields per message")
       ->capture_default_str()
       ->check(CLI::Range(1, 1000));
