@@ -10,6 +10,7 @@
 #include <gtest/gtest.h>
 
 #include "tools/Drivers.h"
+#include "tools/Events.h"
 #include "tools/Export.h"
 #include "tools/Notify.h"
 #include "tools/Preferences.h"
@@ -116,13 +117,26 @@ TEST(CommandLineTest, EventsTakeFilters) {
                              "1970-01-01T00:00:20Z", "--last", "3", "--follow", "--database", "d"});
 
   ASSERT_TRUE(std::holds_alternative<Command>(parsed));
-  const auto& events = *std::get<Command>(parsed).asked<RecordSelection>();
+  const auto& events = std::get<Command>(parsed).asked<ShowEvents>()->selection;
   EXPECT_EQ(events.names, (std::vector<std::string>{"a.*", "b"}));
   EXPECT_EQ(events.since, 10.0);
   EXPECT_EQ(events.until, 20.0);
   EXPECT_EQ(events.last, 3U);
   EXPECT_TRUE(events.follow);
   EXPECT_EQ(events.database, "d");
+}
+
+TEST(CommandLineTest, EventsAreChosenByApplicationCategoryTypeAndPattern) {
+  const auto parsed = parse({"events", "--app", "a*", "--category", "session_playback", "--type",
+                             "Start", "--grep", "x|y", "-n", "4"});
+
+  ASSERT_TRUE(std::holds_alternative<Command>(parsed));
+  const auto& events = *std::get<Command>(parsed).asked<ShowEvents>();
+  EXPECT_EQ(events.applications, std::vector<std::string>{"a*"});
+  EXPECT_EQ(events.categories, std::vector<std::uint32_t>{0x08000004});
+  EXPECT_EQ(events.types, std::vector<std::uint16_t>{1});
+  EXPECT_TRUE(events.selection.grep.has_value());
+  EXPECT_EQ(events.selection.last, 4U);
 }
 
 // The parsed form of a command that is not a request.

@@ -90,9 +90,11 @@ template <typename T, typename Target>
 CLI::Option* addParsed(CLI::App& app, const std::string& name, Target& target,
                        platform::linux_::Result<T> (*parse)(std::string_view),
                        const std::string& description) {
+  // An error shows the long one of "-n,--last".
+  const std::string shown = name.substr(name.rfind(',') + 1);
   return app.add_option_function<std::string>(
       name,
-      [&target, parse, name](const std::string& text) { target = valueOf(parse(text), name); },
+      [&target, parse, shown](const std::string& text) { target = valueOf(parse(text), shown); },
       description);
 }
 

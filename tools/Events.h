@@ -1,7 +1,9 @@
 #pragma once
 
+#include <cstdint>
 #include <ostream>
 #include <string>
+#include <vector>
 
 #include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Command.h"
@@ -14,10 +16,18 @@ namespace halvox::tools {
 // that could control a terminal.
 std::string formatEvent(const platform::linux_::StoredEvent& event, OutputForm form);
 
+// A request for stored events. An empty list stands for all.
+struct ShowEvents {
+  RecordSelection selection{};
+  std::vector<std::string> applications{};  // glob patterns
+  std::vector<std::uint32_t> categories{};  // one without a domain stands for all domains
+  std::vector<std::uint16_t> types{};
+};
+
 // Prints the selected events, newest last. With --follow, continues with new events until the
 // output is closed or the directory of the store is deleted. `outputDescriptor` is the descriptor
 // of `out`.
-ExitStatus showEvents(const RecordSelection& request, OutputForm form, std::ostream& out,
+ExitStatus showEvents(const ShowEvents& request, OutputForm form, std::ostream& out,
                       int outputDescriptor, std::ostream& errors);
 
 }  // namespace halvox::tools

@@ -38,21 +38,53 @@ class EventsTest : public StoredEventsFixture {
   // The field "n" of the events that are shown, in order.
   std::string shown(RecordSelection request) {
     request.database = directory();
+    return shownBy({.selection = request});
+  }
+  std::string shownBy(const ShowEvents& request) {
     std::ostringstream out;
     EXPECT_EQ(showEvents(request, OutputForm::kText, out, -1, errors_), ExitStatus::kDone);
     std::string numbers;
     std::istringstream lines(out.str());
-    for (std::string line; std::getline(lines, line);) numbers += line.substr(line.find("n=") + 2);
+    for (std::string line; std::getline(lines, line);)
+      numbers += line.substr(line.find(" n=") + 3, 1);
     return numbers;
   }
 
   std::ostringstream errors_;
+  std::int64_t number_ = 0;
 };
 
 TEST_F(EventsTest, ShowsEventsNewestLast) {
   storeSome();
 
   EXPECT_EQ(shown({}), "1234");
+}
+
+TEST_F(EventsTest, ChoosesByApplicationCategoryAndType) {
+  for (const char* application : {"player", "browser"}) {
+    for (const char* name : {"Session_Playback.Start", "Playback.Stop"}) {
+      store(std::string("com.tarno.halvox.") + name,
+            {{"HostApplicationDisplayID", application}, {"n", number_++}});
+    }
+  }
+  const auto select = [this](ShowEvents request) {
+    request.selection.database = directory();
+    return shownBy(request);
+  };
+
+  EXPECT_EQ(select({.applications = {"pl*"}}), "01");
+  EXPECT_EQ(select({.categories = {0x08000004}}), "02");
+  EXPECT_EQ(select({.categories = {4}}), "0123");
+  EXPECT_EQ(select({.types = {2}}), "13");
+  EXPECT_EQ(select({.selection = {.last = 1}, .applications = {"player"}}), "1");
+  EXPECT_EQ(select({.applications = {"browser"}, .types = {1}}), "2");
+}
+
+TEST_F(EventsTest, ChoosesByAPatternForNamesAndPayloads) {
+  storeSome();
+
+  EXPECT_EQ(shown({.grep = *TextPattern::compile("b\\.sec|:4")}), "24");
+  EXPECT_EQ(shown({.grep = *TextPattern::compile("COM")}), "");
 }
 
 TEST_F(EventsTest, ChoosesByNameAndTime) {
@@ -80,7 +112,8 @@ TEST_F(EventsTest, JsonHasTimeNameAndPayload) {
   request.database = scratch_.path("state/halvox.db");
   std::ostringstream out;
 
-  EXPECT_EQ(showEvents(request, OutputForm::kJson, out, -1, errors_), ExitStatus::kDone);
+  EXPECT_EQ(showEvents({.selection = request}, OutputForm::kJson, out, -1, errors_),
+            ExitStatus::kDone);
 
   EXPECT_EQ(out.str().substr(0, 44), "{\"time\":100.0,\"name\":\"com.a.first\",\"payload\"");
   EXPECT_EQ(out.str().find('\x1B'), std::string::npos);
@@ -91,7 +124,8 @@ TEST_F(EventsTest, AMissingStoreIsReportedAsNoService) {
   request.database = scratch_.path("elsewhere/halvox.db");
   std::ostringstream out;
 
-  EXPECT_EQ(showEvents(request, OutputForm::kText, out, -1, errors_), ExitStatus::kNoService);
+  EXPECT_EQ(showEvents({.selection = request}, OutputForm::kText, out, -1, errors_),
+            ExitStatus::kNoService);
   EXPECT_NE(errors_.str().find("elsewhere"), std::string::npos);
 }
 
@@ -100,7 +134,8 @@ TEST_F(EventsTest, AnyOtherFileIsABadArgument) {
   request.database = scratch_.path("state/other.db");
   std::ostringstream out;
 
-  EXPECT_EQ(showEvents(request, OutputForm::kText, out, -1, errors_), ExitStatus::kBadArguments);
+  EXPECT_EQ(showEvents({.selection = request}, OutputForm::kText, out, -1, errors_),
+            ExitStatus::kBadArguments);
 }
 
 TEST_F(EventsTest, ABadConfigurationHasItsOwnStatus) {
@@ -140,7 +175,8 @@ TEST_F(EventsTest, FollowingShowsNewEventsUntilTheOutputIsClosed) {
     RecordSelection request;
     request.follow = true;
     request.database = directory();
-    status = static_cast<int>(showEvents(request, OutputForm::kText, out, writeEnd.get(), errors_));
+    status = static_cast<int>(
+        showEvents({.selection = request}, OutputForm::kText, out, writeEnd.get(), errors_));
   });
 
   std::string seen;

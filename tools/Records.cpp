@@ -1,11 +1,13 @@
 #include "tools/Records.h"
 
+#include <algorithm>
 #include <array>
 #include <cstddef>
 #include <cstdio>
 #include <optional>
 #include <span>
 #include <string_view>
+#include <variant>
 
 #include "platform/linux/base/Hexadecimal.h"
 #include "platform/protobuf.h"
@@ -178,6 +180,16 @@ RecordFilter filterOf(const ShowRecords& request) {
       break;
     case ShowRecords::Kind::kSnapshots:
       break;
+  }
+  if (const auto& grep = request.selection.grep) {
+    filter.accepts = [grep, others = filter.accepts](const StoredRecord& record) {
+      const bool matches =
+          std::ranges::any_of(record.fields, [&](const StoredRecord::Field& field) {
+            const auto* text = std::get_if<std::string>(&field);
+            return text != nullptr && grep->matches(*text);
+          });
+      return matches && (!others || others(record));
+    };
   }
   return filter;
 }

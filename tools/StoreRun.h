@@ -13,13 +13,15 @@
 #include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Command.h"
 #include "tools/Complaint.h"
+#include "tools/TextPattern.h"
 
 namespace halvox::tools {
 
 // Selects the stored records that a command shows.
 struct RecordSelection {
-  std::vector<std::string> names{};  // glob patterns; empty: all names
-  std::optional<double> since{};     // seconds since 1970
+  std::vector<std::string> names{};   // glob patterns; empty: all names
+  std::optional<TextPattern> grep{};  // for names and payloads
+  std::optional<double> since{};      // seconds since 1970
   std::optional<double> until{};
   std::optional<std::uint64_t> last{};
   bool follow = false;

@@ -213,12 +213,12 @@ std::vector<TextTable::Column> streamColumns() {
   using Align = TextTable::Align;
   return {{.heading = "ID", .align = Align::kRight},
           {.heading = "STARTED", .least = kUpToSeconds},
-          {.heading = "APPLICATION", .least = 8},
+          {.heading = "APP", .least = 8},
           {.heading = "SERVICE", .least = 8, .rank = 3},
           {.heading = "DIRECTION", .rank = 2},
           {.heading = "DEVICE", .least = 8},
           {.heading = "RAN", .align = Align::kRight},
-          {.heading = "VOLUME", .least = 12, .rank = 1},
+          {.heading = "VOLUME", .least = 10, .rank = 1},
           {.heading = "FORMAT", .least = 12, .rank = 4},
           {.heading = "XRUNS"},
           {.heading = "END"}};

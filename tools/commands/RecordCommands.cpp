@@ -1,5 +1,6 @@
 #include <cstdint>
 #include <memory>
+#include <string>
 #include <vector>
 
 #include "tools/Events.h"
@@ -12,9 +13,9 @@ namespace {
 
 using Kind = ShowRecords::Kind;
 
-ExitStatus runEvents(const RecordSelection& selection, const CommonOptions& options,
+ExitStatus runEvents(const ShowEvents& request, const CommonOptions& options,
                      const ToolStreams& streams) {
-  return showEvents(selection, options.form(), streams.output, streams.outputDescriptor,
+  return showEvents(request, options.form(), streams.output, streams.outputDescriptor,
                     streams.errors);
 }
 
@@ -27,6 +28,22 @@ ExitStatus runRecords(const ShowRecords& request, const CommonOptions& options,
 void addNumbers(CLI::App& app, const char* name, std::vector<std::int64_t>& numbers,
                 const char* description) {
   addEach(app, name, numbers, parseNumber, description)->type_name("N");
+}
+
+template <typename Targets>
+void addCategories(CLI::App& app, Targets& categories, const std::string& records) {
+  addEach(app, "--category", categories, parseCategory,
+          "Only " + records +
+              " of this category: a name such as Session_Playback, or a number. A category without "
+              "a domain, such as Playback, stands for all domains")
+      ->type_name("CATEGORY");
+}
+
+template <typename Targets>
+void addTypes(CLI::App& app, Targets& types, const std::string& records) {
+  addEach(app, "--type", types, parseEventType,
+          "Only " + records + " of this type: a name such as Start, or a number")
+      ->type_name("TYPE");
 }
 
 // Adds a command that shows the records of one kind. Its options are parsed into `request`.
@@ -45,15 +62,24 @@ std::shared_ptr<ShowRecords> makeRequest(Kind kind) {
 }
 
 void addEvents(CommandSet& commands) {
-  const auto selection = std::make_shared<RecordSelection>();
+  const auto request = std::make_shared<ShowEvents>();
   CLI::App& events =
       commands.add({.name = "events",
                     .summary = "Show the events that the service stored, newest last",
                     .example = "halvoxctl events --name 'com.tarno.*' --since 5m --follow",
                     .reach = CommandReach::kFiles});
-  addSelection(events, *selection, "events", "--name");
+  events
+      .add_option("--app", request->applications,
+                  "Only events of applications that match this glob pattern; may be given several "
+                  "times")
+      ->type_name("GLOB")
+      ->expected(1)
+      ->take_all();
+  addCategories(events, request->categories, "events");
+  addTypes(events, request->types, "events");
+  addSelection(events, request->selection, "events", "--name");
   commands.onRun(
-      events, [selection] { return *selection; }, runEvents);
+      events, [request] { return *request; }, runEvents);
 }
 
 void addMetrics(CommandSet& commands) {
@@ -90,14 +116,8 @@ void addLink(CommandSet& commands) {
                               request);
   addNumbers(link, "--session", request->ids,
              "Only messages of this session (-1: those outside any session)");
-  addEach(
-      link, "--category", request->categories, parseCategory,
-      "Only messages of this category: a name such as Session_Playback, or a number. A category "
-      "without a domain, such as Playback, stands for all domains")
-      ->type_name("CATEGORY");
-  addEach(link, "--type", request->types, parseEventType,
-          "Only messages of this type: a name such as Start, or a number")
-      ->type_name("TYPE");
+  addCategories(link, request->categories, "messages");
+  addTypes(link, request->types, "messages");
   addSelection(link, request->selection, "messages", "--service");
 }
 

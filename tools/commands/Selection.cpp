@@ -52,9 +52,14 @@ void addSelection(CLI::App& app, RecordSelection& selection, const char* records
         ->take_all();
   }
   addTimes(app, selection.since, selection.until, records);
-  addParsed(app, "--last", selection.last, parseCount,
+  addParsed(app, "-n,--last", selection.last, parseCount,
             "Only the newest N; 0 with --follow shows new ones only")
       ->type_name("N");
+  addParsed(app, "--grep", selection.grep, TextPattern::compile,
+            only +
+                " with a text that matches this extended regular expression; ignores case unless "
+                "the expression has an upper-case letter")
+      ->type_name("REGEX");
   app.add_flag("--follow", selection.follow,
                std::string("Keep showing ") + records +
                    " as they come; starts with the last 10 unless --since or --last is given");

@@ -55,7 +55,7 @@ void addStreamCommands(CommandSet& commands) {
            "pattern; may be given several times");
   streams.add_flag("--glitched", list->glitched, "Only streams with an xrun");
   addTimes(streams, list->since, list->until, "streams that ran");
-  addParsed(streams, "--last", list->last, parseCount, "Only the newest N")->type_name("N");
+  addParsed(streams, "-n,--last", list->last, parseCount, "Only the newest N")->type_name("N");
   addDatabase(streams, list->database);
   // Without a sub-command it lists.
   commands.onRun(

@@ -186,7 +186,11 @@ bool BlockScan::nextRecord() {
 bool BlockScan::passes(const BlockRecord& record) {
   if (!isWithinTimes(filter_, record.time)) return false;
   if (!kind_.has_value()) return true;
-  if (kind_ == BlockRecordKind::kEvent) return hasName(record.name);
+  if (kind_ == BlockRecordKind::kEvent) {
+    return hasName(record.name) &&
+           (!filter_.acceptsEvent || filter_.acceptsEvent({id(), record.time, record.name,
+                                                           record.payload, record.application}));
+  }
   for (const NumberMatch& match : filter_.numbers) {
     const std::int64_t number = match.column == kLinkSessionID  ? record.sessionID
                                 : match.column == kLinkCategory ? record.category

@@ -27,10 +27,12 @@ SqliteCode EventScan::begin() {
 
 SqliteCode EventScan::skipToNewest(std::uint64_t count) {
   Statement statement;
-  SqliteCode code = database_.prepare(
-      "SELECT id, time, name_id, twin_time, twin_name_id FROM analytics_records"
-      " WHERE id BETWEEN ?1 AND ?2 ORDER BY id DESC",
-      statement);
+  // The payload is long: it is read only for a condition that may need it.
+  const std::string payload = filter_.acceptsEvent ? ", payload" : "";
+  SqliteCode code =
+      database_.prepare("SELECT id, time, name_id, twin_time, twin_name_id" + payload +
+                            " FROM analytics_records WHERE id BETWEEN ?1 AND ?2 ORDER BY id DESC",
+                        statement);
   if (code != SQLITE_OK) return code;
   statement.bind(1, bounds_.first);
   statement.bind(2, bounds_.last);
@@ -89,7 +91,9 @@ bool EventScan::readEvent(const Statement& row, int which, Event& event) {
   event.id = 2 * row.integer(kID) + which;
   event.time = row.real(isTwin ? kTwinTime : kTime);
   event.nameID = row.integer(isTwin ? kTwinNameID : kNameID);
-  return passes(event);
+  return passes(event) &&
+         (!filter_.acceptsEvent ||
+          filter_.acceptsEvent({event.id, event.time, nameOf(event.nameID), row.text(kPayload)}));
 }
 
 bool EventScan::passes(const Event& event) {

@@ -138,7 +138,7 @@ Result<void, StoreError> StoreReader::forEachEvent(const RecordFilter& filter,
         return readOldEvents(before, callback);
       },
       [&](StoredRecordID id, const BlockRecord& record) {
-        callback({id, record.time, record.name, record.payload});
+        callback({id, record.time, record.name, record.payload, record.application});
       });
 }
 

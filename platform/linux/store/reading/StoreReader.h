@@ -34,6 +34,8 @@ struct StoredEvent {
   double time;  // seconds since 1970
   std::string_view name;
   std::string_view payload;  // JSON text
+  // Stored beside the payload; empty for events of earlier versions.
+  std::string_view application{};
 };
 
 // A stored record of any other kind. `fields` has the values of RecordTable::columns, in their
@@ -89,6 +91,8 @@ struct RecordFilter {
   std::vector<NumberMatch> numbers{};     // all must match; events ignore them
   // A further condition, called only for records that meet all others. Events ignore it.
   std::function<bool(const StoredRecord&)> accepts{};
+  // The same for events; the other kinds ignore it.
+  std::function<bool(const StoredEvent&)> acceptsEvent{};
 };
 
 // Reads a store without changing it, whether or not a service writes to it at the same time.
