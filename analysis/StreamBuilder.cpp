@@ -38,15 +38,14 @@ bool isEndReport(const Message& message) {
 bool isAnotherProcess(const ServiceTimes& last, const ServiceTimes& now) {
   constexpr double kRounding = 1.1;  // of the difference of two rounded times
   constexpr double kDisorder = 0.1;
-  constexpr double kNoticeable = 0.2;
-  constexpr double kDrift = 0.001;  // of a clock that is being corrected
+  constexpr double kTick = 0.02;  // the kernel counts the start of a process in these
   const double startChange = now.start - last.start;
   if (now.uptime < last.uptime - kDisorder || std::abs(startChange) > 2 * kRounding) return true;
+  // The process began after the last message. If only the clock was set, the start by the machine's
+  // uptime did not change with it.
   const double passed = now.stamp - last.stamp;
   const double wallChange = passed - (now.uptime - last.uptime);
-  // A clock that was set moves one of the two starts only.
-  return wallChange > kNoticeable + kDrift * std::abs(passed) &&
-         std::abs(wallChange - startChange) <= kRounding;
+  return now.uptime <= passed + kTick && std::abs(wallChange - startChange) <= kRounding;
 }
 
 std::uint64_t programOf(std::string_view application, std::string_view service) {

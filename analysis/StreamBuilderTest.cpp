@@ -123,6 +123,18 @@ TEST_F(StreamBuilderTest, ARestartIsNoticedEvenIfBothProcessesWereYoung) {
   EXPECT_EQ(stories[0].end, StreamEnd::kServiceGone);
 }
 
+TEST_F(StreamBuilderTest, ARestartWithinAFractionOfASecondIsNoticed) {
+  at(0);
+  records.restartService();  // half a second before
+  start(0, stream());
+  at(0.6);
+  records.restartService();
+  volume(0.61, stream(), 0.5, true);
+
+  build();
+  EXPECT_THAT(stories, SizeIs(2));
+}
+
 TEST_F(StreamBuilderTest, AClockThatIsSetIsNotARestart) {
   start(0, stream());
   for (const double step : {-3600.0, -1.0, 5.0, 3600.0}) {
