@@ -74,16 +74,18 @@ Value::Value(const StringConstant& constant) noexcept {
   setPayload(&constant);
 }
 
+const StringConstant* Value::constantWith(std::string_view text) {
+  if (text.size() > kMaxConstantLength) return nullptr;
+  const StringConstant* constant = constantTable()[text.size()];
+  while (constant != nullptr && constant->text() != text) constant = constant->next_;
+  return constant;
+}
+
 Value::Value(std::string_view text) {
-  if (text.size() <= kMaxConstantLength) {
-    for (const StringConstant* constant = constantTable()[text.size()]; constant != nullptr;
-         constant = constant->next_) {
-      if (constant->text() == text) {
-        setTag(Tag::kConstantString);
-        setPayload(constant);
-        return;
-      }
-    }
+  if (const StringConstant* const constant = constantWith(text)) {
+    setTag(Tag::kConstantString);
+    setPayload(constant);
+    return;
   }
   if (text.size() <= kInlineCapacity) {
     setTag(Tag::kInlineString);
@@ -96,6 +98,20 @@ Value::Value(std::string_view text) {
   std::copy(text.begin(), text.end(), rep->text());
   setTag(Tag::kSharedString);
   setPayload(rep);
+}
+
+Value Value::lending(std::string_view text) {
+  if (text.size() <= kInlineCapacity || constantWith(text) != nullptr) return text;
+  Value value;
+  value.lend(text.data(), text.size());
+  return value;
+}
+
+void Value::lend(const char* text, std::size_t length) {
+  setTag(Tag::kLentString);
+  const auto size = static_cast<std::uint32_t>(length);
+  std::memcpy(&storage_[4], &size, sizeof size);
+  setPayload(text);
 }
 
 Value::Value(Date date) noexcept {
@@ -118,6 +134,14 @@ Value::Value(Dictionary dictionary) noexcept {
   const auto count = static_cast<std::uint32_t>(dictionary.size());
   std::memcpy(&storage_[4], &count, sizeof count);
   setPayload(dictionary.rep_.take());
+}
+
+// Allocates memory for a lent text. If there is none, the process ends.
+void Value::onCopied() noexcept {
+  if (!isLent()) return retain();
+  const std::string_view text = string();
+  setTag(Tag::kNone);
+  *this = Value(text);
 }
 
 // The kind of node does not matter here, because every counted node begins with its reference
@@ -151,6 +175,7 @@ void Value::release() noexcept {
     case Tag::kDate:
     case Tag::kInlineString:
     case Tag::kConstantString:
+    case Tag::kLentString:
       break;
   }
   setTag(Tag::kNone);
@@ -216,6 +241,11 @@ std::string_view Value::string() const {
       return {reinterpret_cast<const char*>(&storage_[2]), storage_[1]};
     case Tag::kConstantString:
       return payload<const StringConstant*>()->text();
+    case Tag::kLentString: {
+      std::uint32_t length = 0;
+      std::memcpy(&length, &storage_[4], sizeof length);
+      return {payload<const char*>(), length};
+    }
     case Tag::kSharedString: {
       auto* rep = payload<StringRep*>();
       return {rep->text(), rep->length};
@@ -251,9 +281,12 @@ Dictionary Value::dictionary() const {
   return {payload<DictionaryRep*>(), count};
 }
 
-// Call only if isCounted() is true.
+// Call only for a counted reference or a lent text. A lent text counts as if the value owned it,
+// because it takes room in the dictionary that the value is in.
 std::size_t Value::heapSize() const {
   switch (tag()) {
+    case Tag::kLentString:
+      return string().size();
     case Tag::kSharedString:
       return sizeof(StringRep) + payload<StringRep*>()->length;
     case Tag::kData: {

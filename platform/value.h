@@ -193,6 +193,11 @@ class Value {
   Value(const char* text) : Value(std::string_view(text)) {}
   Value(const std::string& text) : Value(std::string_view(text)) {}
   Value(const StringConstant& constant) noexcept;
+  // Makes a string that only refers to the text, which is lent to it and must outlive it. A short
+  // text and a constant are stored as in any other value. A copy of the value owns its text. A
+  // dictionary that is made from such values copies the texts into its own block of memory, which
+  // saves an allocation for each.
+  [[nodiscard]] static Value lending(std::string_view text);
   Value(Date date) noexcept;
   Value(Data data) noexcept;
   Value(Array array) noexcept;
@@ -200,7 +205,7 @@ class Value {
   // Copying, moving and destroying are inline because every message does dozens of each.
   Value(const Value& other) noexcept {
     std::memcpy(storage_, other.storage_, sizeof storage_);
-    if (isCounted()) retain();
+    if (tag() >= Tag::kLentString) onCopied();
   }
   Value(Value&& other) noexcept {
     std::memcpy(storage_, other.storage_, sizeof storage_);
@@ -269,11 +274,14 @@ class Value {
 
   // Bytes on the heap that this value keeps in memory. Shared bytes count for every holder, which
   // makes the sum an upper bound. The value's own 16 bytes do not count.
-  [[nodiscard]] std::size_t memorySize() const { return isCounted() ? heapSize() : 0; }
+  [[nodiscard]] std::size_t memorySize() const {
+    return tag() >= Tag::kLentString ? heapSize() : 0;
+  }
 
   friend bool operator==(const Value& left, const Value& right);
 
  private:
+  friend class Dictionary;
   enum class Tag : std::uint8_t {
     kNone,
     // One tag for each NumberKind, in its order.
@@ -282,6 +290,10 @@ class Value {
     kDate,
     kInlineString,
     kConstantString,
+    // A text that the value does not own: its address is the payload, its length is in bytes 4 to
+    // 7. The text is in the block of the dictionary that the value is in, or in a message that is
+    // being decoded.
+    kLentString,
     // From here on the payload is a counted reference; isCounted() relies on the order.
     kSharedString,
     kData,
@@ -305,8 +317,15 @@ class Value {
     std::memcpy(&result, &storage_[8], sizeof result);
     return result;
   }
+  [[nodiscard]] bool isLent() const { return tag() == Tag::kLentString; }
+  void lend(const char* text, std::size_t length);
+  // Call after the bytes of another value were copied into this one. Counts the reference, or gives
+  // this value a text of its own instead of a lent one.
+  void onCopied() noexcept;
   void retain() const noexcept;
   void release() noexcept;
+  // The constant with that text, or null.
+  static const StringConstant* constantWith(std::string_view text);
   [[nodiscard]] std::size_t heapSize() const;
   void setNumber(NumberKind kind, std::int64_t number) noexcept;
   void setNumber(NumberKind kind, std::uint64_t number) noexcept;
@@ -314,9 +333,9 @@ class Value {
   static bool equalNumbers(const Value& left, const Value& right);
 
   // Byte 0 is the tag. A number, date or reference is in bytes 8 to 15. A dictionary's number of
-  // entries is in bytes 4 to 7. An inline string has its length in byte 1 and its text from byte 2
-  // on. A value has only 16 bytes, because each entry of a dictionary has one and messages have
-  // dozens of entries.
+  // entries and the length of a lent text are in bytes 4 to 7. An inline string has its length in
+  // byte 1 and its text from byte 2 on. A value has only 16 bytes, because each entry of a
+  // dictionary has one and messages have dozens of entries.
   alignas(8) unsigned char storage_[16] = {};
 };
 
@@ -366,6 +385,9 @@ class Dictionary {
 
   Dictionary() noexcept = default;
   Dictionary(std::initializer_list<Entry> entries);
+  // Moves the entries, whose keys must differ, into a new dictionary with room for `more` others.
+  // Copies lent texts into the block of memory that holds the entries. Allocates only this block.
+  Dictionary(std::span<Entry> entries, std::size_t more);
 
   [[nodiscard]] std::size_t size() const { return rep_ == nullptr ? 0 : count_; }
   [[nodiscard]] bool empty() const { return size() == 0; }
@@ -412,6 +434,10 @@ class Dictionary {
  private:
   friend class Value;
   Dictionary(detail::DictionaryRep* rep, std::uint32_t count) : rep_(rep), count_(count) {}
+  // kYes moves entries out of their block of memory, kNo copies them.
+  enum class Leaving : bool { kNo, kYes };
+  static void transfer(Entry* from, std::size_t count, Leaving leaving, detail::DictionaryRep& to);
+  static std::size_t lentBytes(const Entry* entries, std::size_t count);
   void makeRoomFor(std::size_t entries);
   [[nodiscard]] bool isAlone() const;
   [[nodiscard]] bool tryAddShared(const Key& key, Value& value);

@@ -76,6 +76,9 @@ struct ArrayRep {
 // of them has the first entries of the node, as many as its own `count_`. An entry that was added
 // while the node was shared belongs only to the dictionary that added it and to copies of that. If
 // the node has an index, every dictionary that shares it has all entries.
+//
+// The texts that the node was made with follow the room for the entries. They stay until the node
+// is destroyed, even if their entries are replaced.
 struct DictionaryRep {
   ReferenceCount references;
   // The number of entries that exist. Relaxed, because it only decides which dictionary may add the
@@ -85,10 +88,12 @@ struct DictionaryRep {
   std::uint32_t capacity;
   std::uint32_t indexSize;  // a power of two; 0 while the dictionary is small
   std::uint32_t* index;     // a slot holds the number of its entry plus 1; 0 if it is free
+  std::size_t textBytes;
 
   [[nodiscard]] Dictionary::Entry* entries() {
     return reinterpret_cast<Dictionary::Entry*>(this + 1);
   }
+  [[nodiscard]] char* texts() { return reinterpret_cast<char*>(entries() + capacity); }
 };
 
 // A hash with a secret that each process chooses for itself. It is for tables whose keys come from

@@ -16,10 +16,11 @@ using Reference = detail::Reference<DictionaryRep>;
 constexpr std::uint32_t kMaxWithoutIndex = 16;
 constexpr std::uint32_t kFirstCapacity = 4;
 
-Reference allocateRep(std::size_t capacity) {
-  void* memory = detail::allocateNode<DictionaryRep>(capacity * sizeof(Dictionary::Entry));
-  return Reference(new (memory)
-                       DictionaryRep{{1}, {0}, static_cast<std::uint32_t>(capacity), 0, nullptr});
+Reference allocateRep(std::size_t capacity, std::size_t textBytes) {
+  void* memory =
+      detail::allocateNode<DictionaryRep>(capacity * sizeof(Dictionary::Entry) + textBytes);
+  return Reference(new (memory) DictionaryRep{
+      {1}, {0}, static_cast<std::uint32_t>(capacity), 0, nullptr, textBytes});
 }
 
 void addToIndex(DictionaryRep& rep, std::uint32_t entry) {
@@ -112,6 +113,46 @@ Dictionary::Dictionary(std::initializer_list<Entry> entries) {
   for (const Entry& entry : entries) set(entry.key, entry.value);
 }
 
+Dictionary::Dictionary(std::span<Entry> entries, std::size_t more) {
+  if (entries.empty()) return;
+  const std::size_t count = entries.size();
+  rep_ = allocateRep(count + more, lentBytes(entries.data(), count));
+  count_ = static_cast<std::uint32_t>(count);
+  transfer(entries.data(), count, Leaving::kYes, *rep_);
+  buildIndex(*rep_, count_);
+}
+
+// How many bytes the lent texts of the entries have.
+std::size_t Dictionary::lentBytes(const Entry* entries, std::size_t count) {
+  std::size_t bytes = 0;
+  for (std::size_t position = 0; position < count; ++position) {
+    const Value& value = entries[position].value;
+    if (value.isLent()) bytes += value.string().size();
+  }
+  return bytes;
+}
+
+// Makes entries in a node that has none yet, and has room for them and for their lent texts.
+void Dictionary::transfer(Entry* from, std::size_t count, Leaving leaving, DictionaryRep& to) {
+  char* texts = to.texts();
+  for (std::size_t position = 0; position < count; ++position) {
+    Entry& entry = from[position];
+    Entry* const place = to.entries() + position;
+    if (entry.value.isLent()) {
+      const std::string_view text = entry.value.string();
+      std::copy(text.begin(), text.end(), texts);
+      new (place) Entry{entry.key, Value()};
+      place->value.lend(texts, text.size());
+      texts += text.size();
+    } else if (leaving == Leaving::kYes) {
+      new (place) Entry(std::move(entry));
+    } else {
+      new (place) Entry(entry);
+    }
+  }
+  to.used.store(static_cast<std::uint32_t>(count), std::memory_order_relaxed);
+}
+
 const Dictionary::Entry* Dictionary::begin() const {
   return rep_ == nullptr ? nullptr : rep_->entries();
 }
@@ -132,7 +173,7 @@ bool Dictionary::isAlone() const { return rep_->references.load(std::memory_orde
 // total is allocated.
 void Dictionary::makeRoomFor(std::size_t entries) {
   if (rep_ == nullptr) {
-    rep_ = allocateRep(std::max<std::size_t>(entries, kFirstCapacity));
+    rep_ = allocateRep(std::max<std::size_t>(entries, kFirstCapacity), 0);
     count_ = 0;
     return;
   }
@@ -147,16 +188,15 @@ void Dictionary::makeRoomFor(std::size_t entries) {
   // changed once and then kept. A dictionary that grows entry by entry grows by half of its size.
   const std::size_t capacity =
       alone ? std::max<std::size_t>(entries, rep_->capacity + rep_->capacity / 2) : entries;
-  Reference grown = allocateRep(capacity);
+  Entry* const old = rep_->entries();
+  Reference grown = allocateRep(capacity, rep_->textBytes == 0 ? 0 : lentBytes(old, count_));
+  transfer(old, count_, alone ? Leaving::kYes : Leaving::kNo, *grown);
   if (alone) {
-    std::uninitialized_move_n(rep_->entries(), count_, grown->entries());
     std::swap(grown->index, rep_->index);
     std::swap(grown->indexSize, rep_->indexSize);
   } else {
-    std::uninitialized_copy_n(rep_->entries(), count_, grown->entries());
     copyIndex(*grown, *rep_);
   }
-  grown->used.store(count_, std::memory_order_relaxed);
   rep_ = std::move(grown);
 }
 
@@ -165,6 +205,7 @@ void Dictionary::reserve(std::size_t entries) {
 }
 
 void Dictionary::set(const Key& key, Value value) {
+  if (value.isLent()) value.onCopied();
   const Entry* existing = findEntry(rep_, count_, key);
   if (existing == nullptr) return add(key, std::move(value));
   const auto position = existing - rep_->entries();
@@ -173,6 +214,7 @@ void Dictionary::set(const Key& key, Value value) {
 }
 
 void Dictionary::add(const Key& key, Value value) {
+  if (value.isLent()) value.onCopied();
   if (tryAddShared(key, value)) return;
   makeRoomFor(size() + 1);
   new (rep_->entries() + count_) Entry{key, std::move(value)};
@@ -205,6 +247,7 @@ bool Dictionary::tryAddShared(const Key& key, Value& value) {
 }
 
 void Dictionary::setAt(std::size_t position, Value value) {
+  if (value.isLent()) value.onCopied();
   makeRoomFor(count_);
   rep_->entries()[position].value = std::move(value);
 }
@@ -223,7 +266,10 @@ bool Dictionary::remove(const Key& key) {
 }
 
 void Dictionary::merge(const Dictionary& other) {
-  if (rep_ == nullptr) {
+  // Do not share the block of `other` if it has texts. Merged dictionaries are configurations,
+  // whose values are copied for each message, and each copy of a text in the block would allocate
+  // memory.
+  if (rep_ == nullptr && (other.rep_ == nullptr || other.rep_->textBytes == 0)) {
     *this = other;
     return;
   }
@@ -236,8 +282,11 @@ void Dictionary::merge(const Dictionary& other) {
 std::size_t Dictionary::memorySize() const {
   if (rep_ == nullptr) return 0;
   std::size_t bytes = sizeof(DictionaryRep) + rep_->capacity * sizeof(Entry) +
-                      rep_->indexSize * sizeof(std::uint32_t);
-  for (const Entry& entry : *this) bytes += entry.key.memorySize() + entry.value.memorySize();
+                      rep_->indexSize * sizeof(std::uint32_t) + rep_->textBytes;
+  for (const Entry& entry : *this) {
+    bytes += entry.key.memorySize();
+    if (!entry.value.isLent()) bytes += entry.value.memorySize();
+  }
   return bytes;
 }
 

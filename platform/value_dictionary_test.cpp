@@ -5,6 +5,7 @@
 #include <functional>
 #include <map>
 #include <random>
+#include <span>
 #include <string>
 #include <utility>
 #include <vector>
@@ -435,6 +436,123 @@ TEST(DictionaryTest, SharedEntriesAreThoseThatBothHaveInOneBlock) {
   EXPECT_EQ(message.sharedEntries(equal), 0U);
   EXPECT_EQ(message.sharedEntries(changed), 0U);
   EXPECT_EQ(Dictionary().sharedEntries(Dictionary()), 0U);
+}
+
+// --- Texts in the memory of the dictionary ------------------------------------------------------
+
+// Makes a dictionary from lent texts, which are gone when it returns.
+Dictionary withTexts(std::size_t more) {
+  std::string first = "a text of twenty-odd bytes";
+  std::string second = "a second text of the same kind";
+  std::vector<Dictionary::Entry> entries;
+  entries.push_back({"number", 1});
+  entries.push_back({"first", Value::lending(first)});
+  entries.push_back({"short", Value::lending("short")});
+  entries.push_back({"second", Value::lending(second)});
+  Dictionary dictionary(entries, more);
+  first.assign(first.size(), '-');
+  second.assign(second.size(), '-');
+  return dictionary;
+}
+
+void expectTexts(const Dictionary& dictionary) {
+  ASSERT_NE(dictionary.find("first"), nullptr);
+  ASSERT_NE(dictionary.find("second"), nullptr);
+  EXPECT_EQ(dictionary.find("first")->string(), "a text of twenty-odd bytes");
+  EXPECT_EQ(dictionary.find("second")->string(), "a second text of the same kind");
+}
+
+TEST(DictionaryTextsTest, AreCopiedIntoTheDictionary) {
+  const Dictionary dictionary = withTexts(0);
+
+  expectTexts(dictionary);
+  EXPECT_EQ(keysOf(dictionary), (std::vector<std::string>{"number", "first", "short", "second"}));
+  const auto* const end = reinterpret_cast<const char*>(dictionary.end());
+  EXPECT_EQ(static_cast<const void*>(dictionary.find("first")->string().data()), end);
+}
+
+TEST(DictionaryTextsTest, StayWhenEntriesAreAddedInTheRoomThatWasMade) {
+  Dictionary dictionary = withTexts(2);
+  const Dictionary::Entry* const before = dictionary.begin();
+
+  dictionary.add("more", 1);
+  dictionary.add("and more", 2);
+
+  EXPECT_EQ(dictionary.begin(), before);
+  expectTexts(dictionary);
+}
+
+TEST(DictionaryTextsTest, MoveWithADictionaryThatGrows) {
+  Dictionary dictionary = withTexts(0);
+
+  for (int number = 0; number < 40; ++number) dictionary.set("key " + std::to_string(number), 1);
+
+  expectTexts(dictionary);
+  EXPECT_EQ(dictionary.size(), 44U);
+}
+
+TEST(DictionaryTextsTest, AreCopiedWithASharedDictionary) {
+  Dictionary copy;
+  {
+    const Dictionary original = withTexts(0);
+    copy = original;
+    copy.set("number", 2);
+    EXPECT_EQ(original.find("number")->toInt64(), 1);
+    EXPECT_NE(copy.find("first")->string().data(), original.find("first")->string().data());
+  }
+  expectTexts(copy);
+}
+
+TEST(DictionaryTextsTest, OutliveTheirEntryAndTheirDictionary) {
+  Dictionary dictionary = withTexts(0);
+  const Value copy = *dictionary.find("first");
+
+  dictionary.remove("first");
+  EXPECT_EQ(dictionary.find("second")->string(), "a second text of the same kind");
+  dictionary.set("second", "other");
+  dictionary = {};
+
+  EXPECT_EQ(copy.string(), "a text of twenty-odd bytes");
+}
+
+TEST(DictionaryTextsTest, AreMergedAsTextsOfTheirOwn) {
+  Dictionary merged;
+  {
+    const Dictionary dictionary = withTexts(0);
+    merged.merge(dictionary);
+    EXPECT_FALSE(merged.isIdenticalTo(dictionary));
+  }
+  expectTexts(merged);
+  // Copies of such a value share its text.
+  const Value copy = *merged.find("first");
+  EXPECT_TRUE(copy.isIdenticalTo(*merged.find("first")));
+}
+
+TEST(DictionaryTextsTest, CountOnceAsMemory) {
+  const Dictionary dictionary = withTexts(0);
+  Dictionary owning;
+  owning.reserve(4);
+  for (const Dictionary::Entry& entry : dictionary) owning.set(entry.key, entry.value);
+
+  EXPECT_GE(dictionary.memorySize(), 4 * sizeof(Dictionary::Entry) + 56);
+  EXPECT_LE(dictionary.memorySize(), owning.memorySize());
+}
+
+TEST(DictionaryTextsTest, DictionaryOfManyEntriesHasAnIndex) {
+  std::string text(20, 't');
+  std::vector<Dictionary::Entry> entries;
+  for (int number = 0; number < 100; ++number) {
+    entries.push_back({"key " + std::to_string(number), Value::lending(text)});
+  }
+  const Dictionary dictionary(entries, 3);
+  text.assign(20, '-');
+
+  for (int number = 0; number < 100; ++number) {
+    const Value* const found = dictionary.find("key " + std::to_string(number));
+    ASSERT_NE(found, nullptr);
+    EXPECT_EQ(found->string(), std::string(20, 't'));
+  }
+  EXPECT_TRUE(Dictionary(std::span<Dictionary::Entry>(), 3).empty());
 }
 
 }  // namespace

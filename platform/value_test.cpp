@@ -275,5 +275,55 @@ TEST(ValueMemoryTest, ContainersCountWhatTheyHold) {
   EXPECT_GE(Value(Dictionary{{"a", Array{text}}}).memorySize(), 1000U + 16 + 24);
 }
 
+// --- Lent texts ---------------------------------------------------------------------------------
+
+TEST(LentValueTest, HasTheTextWhereItIs) {
+  const std::string text(kSharedText);
+  const Value value = Value::lending(text);
+
+  EXPECT_TRUE(value.isString());
+  EXPECT_EQ(value.string().data(), text.data());
+  EXPECT_EQ(value, Value(text));
+  EXPECT_EQ(describe(value), text);
+  EXPECT_EQ(value.memorySize(), text.size());
+}
+
+TEST(LentValueTest, CopyOwnsItsText) {
+  std::string text(kSharedText);
+  const Value lent = Value::lending(text);
+
+  const Value copy = lent;  // NOLINT(performance-unnecessary-copy-initialization): what is tested
+  Value assigned = 1;
+  assigned = lent;
+  text.assign(text.size(), '-');
+
+  EXPECT_EQ(copy.string(), kSharedText);
+  EXPECT_EQ(assigned.string(), kSharedText);
+  EXPECT_EQ(Array({lent})[0].string(), text);
+}
+
+TEST(LentValueTest, ShortTextsAndConstantsAreAsAlways) {
+  std::string text(kInlineText);
+  const Value value = Value::lending(text);
+  text.assign(text.size(), '-');
+
+  EXPECT_EQ(value.string(), kInlineText);
+  EXPECT_EQ(value.memorySize(), 0U);
+  EXPECT_TRUE(Value::lending(std::string(kLongConstant.text())).isIdenticalTo(kLongConstant));
+}
+
+TEST(LentValueTest, DictionaryNeverKeepsALentText) {
+  std::string text(kSharedText);
+  Dictionary dictionary;
+  dictionary.set("set", Value::lending(text));
+  dictionary.add("added", Value::lending(text));
+  dictionary.set("replaced", 1);
+  dictionary.set("replaced", Value::lending(text));
+  dictionary.setAt(0, Value::lending(text));
+  text.assign(text.size(), '-');
+
+  for (const Dictionary::Entry& entry : dictionary) EXPECT_EQ(entry.value.string(), kSharedText);
+}
+
 }  // namespace
 }  // namespace halvox::platform

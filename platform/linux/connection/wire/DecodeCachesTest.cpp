@@ -205,6 +205,49 @@ TEST_F(DecodeCachesTest, DictionariesHaveRoomForTheEntriesOfTheReceiver) {
   EXPECT_EQ(message.size(), 12U);
 }
 
+TEST_F(DecodeCachesTest, TextsOfEveryLengthAreDecodedAnew) {
+  for (const std::size_t length : {0U, 14U, 15U, 127U, 128U, 129U, 1000U}) {
+    for (const char letter : {'a', 'b', 'c'}) {
+      expectSame(messageBody(typicalEntries(1, std::string(length, letter)), 1));
+    }
+  }
+}
+
+TEST_F(DecodeCachesTest, TextsOutliveTheBytesOfTheirMessage) {
+  for (const std::size_t length : {15U, 128U, 129U}) {
+    const std::string text(length, 't');
+    Decoded result;
+    for (int round = 0; round < 2; ++round) {
+      auto body = std::make_unique<std::string>(messageBody(typicalEntries(1, text), 1));
+      result = decoded(*body, scratch_);
+      body->assign(body->size(), '-');
+    }
+    const Dictionary message = result.values.front().dictionary();
+    ASSERT_NE(message.find("route"), nullptr);
+    EXPECT_EQ(message.find("route")->string(), text);
+  }
+}
+
+TEST_F(DecodeCachesTest, LastOfEntriesWithOneKeyOutlivesTheBytesOfItsMessage) {
+  const std::string text(20, 't');
+  Decoded result;
+  for (int round = 0; round < 2; ++round) {
+    WireBytes entries = typicalEntries(1, std::string(30, 'u'));
+    entry(entries, "route", "s").text(text);
+    std::string body = messageBody(entries, 1);
+    expectSame(body);
+    result = decoded(body, scratch_);
+    body.assign(body.size(), '-');
+  }
+  EXPECT_EQ(result.values.front().dictionary().find("route")->string(), text);
+}
+
+TEST_F(DecodeCachesTest, TextsThatAreNotUTF8AreRefusedAsBefore) {
+  expectSame(messageBody(typicalEntries(1, std::string(20, 't')), 1));
+  expectSame(messageBody(typicalEntries(1, std::string(19, 't') + "\xFF"), 1));
+  expectSame(messageBody(typicalEntries(1, std::string(10, 't') + '\0' + std::string(9, 't')), 1));
+}
+
 // --- Headers ------------------------------------------------------------------------------------
 
 struct ReadHeader {

@@ -16,6 +16,9 @@ using Kind = DecodeError::Kind;
 // scratch each time. Without a bound, the memory for the largest message would stay allocated until
 // the service ends.
 constexpr std::size_t kKeptElements = 1024;
+// Texts of at most this length are stored in the block of memory of their dictionary. Each copy of
+// such a value copies the text, while the copies of a longer one share it.
+constexpr std::size_t kMostBytesInDictionary = 128;
 
 // Decodes the values of one body. In all functions, `type` is one valid, complete type, because the
 // signatures of frames and variants are checked before they are used. `level` is the number of
@@ -35,6 +38,7 @@ class Decoder {
   Value decodeBoolean(std::string_view type);
   Value decodeDate(std::string_view type);
   Value decodeVariant(unsigned level);
+  Value decodeLentText(std::string_view type);
   Value decodeData();
   Value decodeArray(std::string_view type, unsigned level);
   Value decodeDictionary(std::string_view type, unsigned level);
@@ -196,6 +200,13 @@ Value Decoder::decodeVariant(unsigned level) {
   return refuse(Kind::kMalformed, "the signature of a variant is invalid", type);
 }
 
+// Decodes a text that takeEntries() will copy into its dictionary, before the frame is released.
+Value Decoder::decodeLentText(std::string_view type) {
+  std::string_view text;
+  if (!reader_.readText(text)) return malformed(type);
+  return text.size() <= kMostBytesInDictionary ? Value::lending(text) : Value(text);
+}
+
 Value Decoder::decodeData() {
   std::size_t outerLimit = 0;
   if (!reader_.enterArray(1, outerLimit)) return malformed("ay");
@@ -244,17 +255,12 @@ Dictionary Decoder::takeEntries(std::size_t first, unsigned level) {
   std::vector<Dictionary::Entry>& scratch = scratch_.entries;
   const std::span<Dictionary::Entry> entries = std::span(scratch).subspan(first);
   Dictionary dictionary;
-  // If keys occur twice, this reserves too much memory, which does no other harm.
-  if (!entries.empty()) {
+  if (level == 1 && hasDistinctKeys_) {
+    dictionary = Dictionary(entries, scratch_.addedEntries);
+  } else if (!entries.empty()) {
+    // If keys occur twice, this reserves too much memory, which does no other harm.
     dictionary.reserve(entries.size() + (level == 1 ? scratch_.addedEntries : 0));
-  }
-  const bool areDistinct = level == 1 && hasDistinctKeys_;
-  for (Dictionary::Entry& entry : entries) {
-    if (areDistinct) {
-      dictionary.add(entry.key, std::move(entry.value));
-    } else {
-      dictionary.set(entry.key, std::move(entry.value));
-    }
+    for (Dictionary::Entry& entry : entries) dictionary.set(entry.key, std::move(entry.value));
   }
   scratch.erase(scratch.begin() + static_cast<std::ptrdiff_t>(first), scratch.end());
   return dictionary;
@@ -268,7 +274,7 @@ bool Decoder::decodeKnownEntry(unsigned level) {
   const std::string_view type = reader_.rest().substr(head.bytes - 2, 1);
   if (head.isRepeated) hasDistinctKeys_ = false;
   reader_.skip(head.bytes);
-  Value value = decode(type, level);
+  Value value = type == "s" ? decodeLentText(type) : decode(type, level);
   if (failed_) {
     path_.putBefore(head.key->text());
   } else {
