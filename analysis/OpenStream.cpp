@@ -4,6 +4,8 @@
 #include <cmath>
 #include <string>
 
+#include "analysis/XrunFigures.h"
+
 #include "platform/linux/base/Utf8.h"
 
 namespace halvox::analysis {
@@ -16,7 +18,6 @@ constexpr std::string_view kDevicesKey = "active_devices";
 constexpr std::string_view kDeviceNamesKey = "device_node_names";
 constexpr std::string_view kVolumeKey = "RQSessionVolume";
 constexpr std::string_view kPlayingKey = "RQSessionVolumePlayingState";
-constexpr std::string_view kIssueTypeKey = "issue_type";
 constexpr double kMillisecondsPerSecond = 1000;
 
 // The beginning of a text, cut between two characters.
@@ -60,11 +61,7 @@ bool addChange(std::vector<StreamChange>& changes, std::uint64_t& notKept, Strea
   return true;
 }
 
-double positive(const Payload& payload, std::string_view key) {
-  return std::max(0.0, payload.number(key).value_or(0));
-}
-
-// A count of missed cycles or of samples. A number that is out of range is a client's mistake.
+// A count of samples. A number that is out of range is a client's mistake.
 std::int64_t count(const Payload& payload, std::string_view key) {
   constexpr std::int64_t kMost = std::int64_t{1} << 40U;
   return std::clamp<std::int64_t>(payload.integer(key).value_or(0), 0, kMost);
@@ -109,7 +106,7 @@ void OpenStream::add(const Message& message, const Payload& payload) {
       return onRun(message, message.type == "Start");
     }
   }
-  if (payload.text(kIssueTypeKey) == "xrun") return onXrun(message, payload);
+  if (isXrun(message.type, payload)) return onXrun(message, payload);
   // One message may have several of these keys.
   const bool hasState =
       payload.text(kFormatKey) || payload.text(kDevicesKey) || payload.has(kVolumeKey);
@@ -180,12 +177,9 @@ void OpenStream::onXrun(const Message& message, const Payload& payload) {
   moment.time = last_.stamp;
   moment.messageID = message.id;
   StreamMoment::Xrun& xrun = moment.xrun;
-  // Reporters of earlier versions send the length in seconds only.
-  xrun.milliseconds =
-      payload.number("xrun_milliseconds")
-          ? positive(payload, "xrun_milliseconds")
-          : positive(payload, "any_channel_silence_seconds") * kMillisecondsPerSecond;
-  xrun.missedCycles = static_cast<std::uint64_t>(count(payload, "missed_cycles"));
+  const XrunFigures figures = xrunFigures(payload);
+  xrun.milliseconds = figures.milliseconds;
+  xrun.missedCycles = figures.missedCycles;
   const std::string_view role = payload.text("xrun_role").value_or(std::string_view());
   XrunTotals& totals = story_.xruns;
   ++totals.reports;

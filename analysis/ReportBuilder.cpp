@@ -7,13 +7,13 @@
 #include "analysis/DriverReport.h"
 #include "analysis/IssueMetric.h"
 #include "analysis/MessageNames.h"
+#include "analysis/XrunFigures.h"
 
 #include "platform/linux/base/Utf8.h"
 
 namespace halvox::analysis {
 namespace {
 
-constexpr double kMillisecondsPerSecond = 1000;
 constexpr std::string_view kDriverReports = "IOReporting";
 
 // What every message has besides its content.
@@ -26,11 +26,6 @@ double positive(std::optional<double> number) { return std::max(number.value_or(
 
 std::int64_t positive(std::optional<std::int64_t> number) {
   return std::max<std::int64_t>(number.value_or(0), 0);
-}
-
-double lostMilliseconds(const Payload& payload) {
-  if (const auto exact = payload.number("xrun_milliseconds")) return positive(exact);
-  return positive(payload.number("any_channel_silence_seconds")) * kMillisecondsPerSecond;
 }
 
 // Moves the rows of a table in the order of `isBefore`.
@@ -111,22 +106,22 @@ void ReportBuilder::addMessage(const Record& record) {
   message->application = name(record.application);
   message->payload = platform::linux_::utf8Prefix(record.payload->json(), bounds_.payload);
   xruns_.addMessage(std::move(message));
-  if (record.type == "IssueDetector") addXrun(record);
+  if (isXrun(record.type, *record.payload)) addXrun(record);
   if (record.category == kDriverReports) addDriverReport(record);
   if (record.category == "Setup" && record.type == "Setup") addSettings(record);
 }
 
 void ReportBuilder::addXrun(const Record& record) {
   const Payload& payload = *record.payload;
-  if (payload.text("issue_type") != "xrun") return;
   const auto text = [&](std::string_view key) { return payload.text(key).value_or(""); };
   ReportXrun xrun;
   xrun.messageID = record.id;
   xrun.time = record.time;
   xrun.application = name(record.application.empty() ? text("rtaid_client") : record.application);
   xrun.device = name(text("device_node_name"));
-  xrun.milliseconds = lostMilliseconds(payload);
-  xrun.missedCycles = static_cast<std::uint64_t>(positive(payload.integer("missed_cycles")));
+  const XrunFigures figures = xrunFigures(payload);
+  xrun.milliseconds = figures.milliseconds;
+  xrun.missedCycles = figures.missedCycles;
   xrun.quantum = positive(payload.integer("quantum"));
   xrun.rate = positive(payload.integer("rate"));
   xrun.role = name(text("xrun_role"));

@@ -94,6 +94,45 @@ TEST(ReportBuilderTest, OtherIssuesAreNotXruns) {
   EXPECT_EQ(reportOf(series).totals.xruns, 0U);
 }
 
+TEST(ReportBuilderTest, OnlyIssuesAreXrunsInTheStreamsToo) {
+  RecordSeries series;
+  series.at(1'000'000);
+  start(series, kPlayer);
+  series.message(kPlayer, "Session_Playback", "State",
+                 R"("issue_type":"xrun","xrun_milliseconds":5)");
+  stop(series, kPlayer);
+
+  const ReportData data = reportOf(series);
+
+  EXPECT_EQ(data.totals.xruns, 0U);
+  ASSERT_EQ(data.streams.size(), 1U);
+  EXPECT_EQ(data.streams.front().story.xruns.reports, 0U);
+}
+
+TEST(ReportBuilderTest, ImpossibleFiguresAreLimited) {
+  constexpr double kDayMilliseconds = 86'400'000;
+  RecordSeries series;
+  series.at(1'000'000);
+  start(series, kPlayer);
+  for (const char* figures :
+       {R"("xrun_milliseconds":1e308,"missed_cycles":4611686018427387904)",
+        R"("any_channel_silence_seconds":1e306,"missed_cycles":4611686018427387904)",
+        R"("xrun_milliseconds":-5,"missed_cycles":-7)"}) {
+    series.message(kPlayer, "Session_Playback", "IssueDetector",
+                   R"("issue_type":"xrun",)" + std::string(figures));
+  }
+  stop(series, kPlayer);
+
+  const ReportData data = reportOf(series);
+
+  EXPECT_EQ(data.totals.xruns, 3U);
+  EXPECT_EQ(data.totals.xrunMilliseconds, 2 * kDayMilliseconds);
+  EXPECT_EQ(data.totals.missedCycles, std::uint64_t{2} << 40U);
+  ASSERT_EQ(data.streams.size(), 1U);
+  EXPECT_EQ(data.streams.front().story.xruns.milliseconds, 2 * kDayMilliseconds);
+  EXPECT_EQ(data.streams.front().story.xruns.missedCycles, std::uint64_t{2} << 40U);
+}
+
 TEST(ReportBuilderTest, TotalsAreThoseOfAllRecords) {
   RecordSeries series;
   series.at(1'000'000);

@@ -65,8 +65,10 @@ class Json {
   // cannot hold numbers that are not finite.
   void number(double number) {
     constexpr double kDigits = 1000;
-    if (!std::isfinite(number)) return null();
-    writer_.Double(std::round(number * kDigits) / kDigits);
+    const double scaled = std::round(number * kDigits);
+    // A large number has no digits after the point, and the scaled one may be infinite.
+    const double rounded = std::isfinite(scaled) ? scaled / kDigits : number;
+    std::isfinite(rounded) ? void(writer_.Double(rounded)) : null();
   }
   void number(std::optional<double> value) { value ? number(*value) : null(); }
 

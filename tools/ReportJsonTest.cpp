@@ -59,6 +59,13 @@ TEST(ReportJsonTest, BytesThatAreNotUtf8AreReplaced) {
   EXPECT_STREQ(parsed(jsonOf(data))["power"][0]["name"].GetString(), "a\xEF\xBF\xBD");
 }
 
+TEST(ReportJsonTest, LargeNumbersStayNumbers) {
+  ReportData data;
+  data.totals.xrunMilliseconds = 1e306;
+
+  EXPECT_EQ(parsed(jsonOf(data))["totals"]["xrunMs"].GetDouble(), 1e306);
+}
+
 TEST(ReportJsonTest, NumbersThatJsonCannotHoldAreNull) {
   ReportData data;
   data.totals.xrunMilliseconds = NAN;

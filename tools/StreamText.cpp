@@ -121,6 +121,8 @@ std::string xrunSentence(const StreamMoment::Xrun& xrun) {
     text +=
         ": " + (xrun.lateNode.empty() ? "another node" : harmlessText(xrun.lateNode)) + " was late";
     if (!xrun.lateProcess.empty()) text += ", of process " + harmlessText(xrun.lateProcess);
+    // Tells two streams of one program apart.
+    if (xrun.lateObjectSerial) text += ", object " + std::to_string(*xrun.lateObjectSerial);
   }
   return text + ".";
 }
@@ -339,6 +341,9 @@ std::string momentJson(const StreamMoment& moment) {
       json += ",\"device\":" + tools::quoted(moment.xrun.device);
       json += ",\"late_node\":" + tools::quoted(moment.xrun.lateNode);
       json += ",\"late_process\":" + tools::quoted(moment.xrun.lateProcess);
+      json +=
+          ",\"late_object_serial\":" +
+          (moment.xrun.lateObjectSerial ? std::to_string(*moment.xrun.lateObjectSerial) : "null");
       break;
     case StreamMoment::Kind::kBegan:
     case StreamMoment::Kind::kStart:

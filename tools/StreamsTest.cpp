@@ -120,7 +120,7 @@ TEST(StreamTextTest, SaysWhoWasLate) {
 
   EXPECT_EQ(describeMoment({}, moment),
             "It lost 21 ms in 1 cycle on hw0 (quantum 1024 at 48000 Hz): browser was late, of "
-            "process web.");
+            "process web, object 9.");
   moment.xrun.role = "culprit";
   EXPECT_THAT(describeMoment({}, moment), HasSubstr(": this stream was late."));
 }
