@@ -173,7 +173,11 @@ SqliteCode MessageBlocks::afterAdding() {
 
 SqliteCode MessageBlocks::end() {
   if (writer_.records() == 0) return SQLITE_OK;
-  return insert(writer_.records() >= kRecordsToSeal ? Row::kSealed : Row::kOpen);
+  // Open rows that were gathered must not become an open row again, however few their records are:
+  // firstOpen_ is already past their numbers.
+  const bool hasOpenRows = gathered_.first < firstOpen_;
+  const bool isEnough = hasOpenRows || writer_.records() >= kRecordsToSeal;
+  return insert(isEnough ? Row::kSealed : Row::kOpen);
 }
 
 // Writes the records of writer_ into a row.

@@ -94,6 +94,27 @@ TEST_F(MessageBlocksTest, RowsThatHaveGatheredBecomeOneBlockWithTheSameNumbers) 
   EXPECT_EQ(payloads(), numberedTo(300));
 }
 
+// Few long payloads fill the open rows before there are many records, and they shrink when their
+// rows are joined, because they share most of their bytes.
+TEST_F(MessageBlocksTest, LongPayloadsThatAreAlikeAreAllKept) {
+  constexpr std::int64_t kCount = 40;
+  const std::string text(100'000, 'x');
+  start();
+  std::vector<std::string> sent;
+  for (std::int64_t number = 0; number < kCount; ++number) {
+    service->sendAnalyticsEventLazy("long", [&] {
+      return Dictionary{{"text", text}, {"n", number}};
+    });
+    ASSERT_TRUE(allIsStored());
+    sent.push_back(R"({"text":")" + text + R"(","n":)" + std::to_string(number) + "}");
+  }
+  stop();
+
+  EXPECT_TRUE(payloads() == sent);
+  EXPECT_TRUE(read({}) == sent);
+  EXPECT_EQ(value("SELECT sum(records), max(id + records) FROM message_blocks"), "40|41");
+}
+
 TEST_F(MessageBlocksTest, FollowerMeetsEachRecordOnceWhileRowsAreJoined) {
   start();
   EventFollower follower;
