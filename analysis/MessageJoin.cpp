@@ -1,6 +1,7 @@
 #include "analysis/MessageJoin.h"
 
 #include <bit>
+#include <cmath>
 #include <utility>
 
 #include "analysis/MessageNames.h"
@@ -55,8 +56,12 @@ void MessageJoin::addEvent(const Record& record) {
   if (message == nullptr) message = &push(record, key);
   message->message.isEvent = true;
   // The link's payload has another key. The event's payload replaces it, because the second event
-  // of a message is recognised by its equal payload.
-  if (message->message.isLinkMessage) message->message.payload = record.payload->json();
+  // of a message is recognised by its equal payload. The event's ID is the one by which others know
+  // the message.
+  if (message->message.isLinkMessage) {
+    setPayload(message->message, record);
+    message->message.id = record.id;
+  }
   message->message.application = record.application;
   message->hasCommon = isCommon;
   if (!isCommon) message->message.service = record.service;
@@ -118,7 +123,11 @@ MessageJoin::Waiting* MessageJoin::find(std::uint64_t key, const Record& record)
 }
 
 MessageJoin::Waiting& MessageJoin::push(const Record& record, std::uint64_t key) {
-  if (waiting_.size() == kMostWaiting) deliverFirst();
+  const std::size_t bytes = record.payload->json().size();
+  while (!waiting_.empty() &&
+         (waiting_.size() == kMostWaiting || waitingBytes_ + bytes > kMostWaitingBytes)) {
+    deliverFirst();
+  }
   const std::uint64_t number = firstNumber_ + waiting_.size();
   Waiting& added = waiting_.emplace_back();
   added.key = key;
@@ -126,10 +135,16 @@ MessageJoin::Waiting& MessageJoin::push(const Record& record, std::uint64_t key)
   added.message.time = record.time;
   added.message.category = record.category;
   added.message.type = record.type;
-  added.message.payload = record.payload->json();
+  setPayload(added.message, record);
   if (key != 0) byKey_.emplace(key, number);
   if (record.kind == RecordKind::kEvent && !record.category.empty()) lastEvent_ = number;
   return added;
+}
+
+void MessageJoin::setPayload(Message& message, const Record& record) {
+  waitingBytes_ -= message.payload.size();
+  message.payload = record.payload->json();
+  waitingBytes_ += message.payload.size();
 }
 
 MessageJoin::Waiting* MessageJoin::waiting(std::uint64_t number) {
@@ -140,7 +155,8 @@ MessageJoin::Waiting* MessageJoin::waiting(std::uint64_t number) {
 void MessageJoin::deliverReady(double now) {
   while (!waiting_.empty()) {
     const Waiting& first = waiting_.front();
-    if (!first.isComplete && now - first.message.time <= kLongestWait) return;
+    // The absolute difference also ends the wait after the clock was set back.
+    if (!first.isComplete && std::abs(now - first.message.time) <= kLongestWait) return;
     deliverFirst();
   }
 }
@@ -149,6 +165,7 @@ void MessageJoin::deliverFirst() {
   // Taken out of the queue before the callback, which must not see a half-delivered queue.
   Waiting first = std::move(waiting_.front());
   waiting_.pop_front();
+  waitingBytes_ -= first.message.payload.size();
   const std::uint64_t number = firstNumber_++;
   const auto [begin, end] = byKey_.equal_range(first.key);
   for (auto place = begin; place != end; ++place) {

@@ -15,7 +15,7 @@ namespace halvox::analysis {
 
 // One message of a client, or of the service itself, with all that its records say.
 struct Message {
-  std::int64_t id = 0;      // of its first record
+  std::int64_t id = 0;      // of its first event, or of its link message if it has no event
   double time = 0;          // when it was recorded, in seconds since 1970
   std::string name;         // of an event that is not a message, such as the end of a client
   std::string service;      // empty if unknown
@@ -34,13 +34,14 @@ struct Message {
 //
 // The link records a message later than the events do. It never records a message that repeats the
 // one before, or any message of a service without a link in the store. A message therefore waits
-// for its other record until kLongestWait seconds of records, or kMostWaiting messages, have
-// passed. Messages come out in the order of their first records. Memory is bounded. Belongs to one
-// thread.
+// for its other record until kLongestWait seconds of records, kMostWaiting messages, or
+// kMostWaitingBytes of payloads have passed. A payload that is larger waits alone. Messages come
+// out in the order of their first records. Belongs to one thread.
 class MessageJoin {
  public:
   static constexpr double kLongestWait = 10;
   static constexpr std::size_t kMostWaiting = 4096;
+  static constexpr std::size_t kMostWaitingBytes = std::size_t{16} << 20U;  // of payloads
 
   using Callback = std::function<void(const Message&)>;
   // Calls `callback` from add() and finish().
@@ -65,12 +66,14 @@ class MessageJoin {
   // Finds a message that waits for a record of the other kind.
   [[nodiscard]] Waiting* find(std::uint64_t key, const Record& record);
   Waiting& push(const Record& record, std::uint64_t key);
+  void setPayload(Message& message, const Record& record);
   void deliverReady(double now);
   void deliverFirst();
   [[nodiscard]] Waiting* waiting(std::uint64_t number);
 
   Callback callback_;
   std::deque<Waiting> waiting_;
+  std::size_t waitingBytes_ = 0;                                 // of the payloads
   std::uint64_t firstNumber_ = 0;                                // of waiting_.front()
   std::unordered_multimap<std::uint64_t, std::uint64_t> byKey_;  // key to number
   std::optional<std::uint64_t> lastEvent_;  // the number of the last event's message

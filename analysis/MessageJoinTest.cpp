@@ -1,0 +1,83 @@
+#include "analysis/MessageJoin.h"
+
+#include <string>
+#include <vector>
+
+#include "analysis/testing/RecordSeries.h"
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace halvox::analysis {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using ::testing::SizeIs;
+
+class MessageJoinTest : public testing::Test {
+ protected:
+  void addAll() {
+    EXPECT_TRUE(records.forEach({}, [this](const Record& record) { join.add(record); }));
+  }
+
+  RecordSeries records;
+  std::vector<std::int64_t> delivered;  // the IDs
+  MessageJoin join{[this](const Message& message) { delivered.push_back(message.id); }};
+};
+
+TEST_F(MessageJoinTest, AMessageHasTheIDOfItsEventEvenIfTheLinkRecordedItFirst) {
+  records.link({}, "Session_Playback", "Start");
+  records.event({}, "Session_Playback", "Start");
+  addAll();
+  join.finish();
+
+  EXPECT_THAT(delivered, ElementsAre(2));
+}
+
+TEST_F(MessageJoinTest, AMessageThatOnlyTheLinkRecordedHasTheIDOfThatRecord) {
+  records.link({}, "Session_Playback", "Start");
+  addAll();
+  join.finish();
+
+  EXPECT_THAT(delivered, ElementsAre(1));
+}
+
+TEST_F(MessageJoinTest, TheBytesOfWaitingMessagesAreBounded) {
+  const std::string text(1U << 20U, 'x');
+  constexpr std::size_t kMessages = 20;
+  for (std::size_t number = 0; number < kMessages; ++number) {
+    records.event({}, "Session_Playback", "Start", "\"text\":\"" + text + "\"");
+  }
+  addAll();
+
+  // 15 of these wait: each has some bytes more than a mebibyte.
+  EXPECT_THAT(delivered, SizeIs(kMessages - 15));
+  join.finish();
+  EXPECT_THAT(delivered, SizeIs(kMessages));
+}
+
+TEST_F(MessageJoinTest, APayloadAboveTheBoundWaitsAlone) {
+  const std::string text(MessageJoin::kMostWaitingBytes + 1, 'x');
+  records.event({}, "Session_Playback", "Start");
+  records.event({}, "Session_Playback", "Start", "\"text\":\"" + text + "\"");
+  addAll();
+
+  EXPECT_THAT(delivered, ElementsAre(1));
+  join.finish();
+  EXPECT_THAT(delivered, ElementsAre(1, 3));
+}
+
+TEST_F(MessageJoinTest, AClockThatIsSetBackDoesNotStopTheDelivery) {
+  records.event({}, "Session_Playback", "Start");
+  addAll();
+  EXPECT_THAT(delivered, IsEmpty());
+
+  RecordSeries later;
+  later.setClock(1'000'000 - 3600);
+  later.event({}, "Session_Playback", "Stop");
+  EXPECT_TRUE(later.forEach({}, [this](const Record& record) { join.add(record); }));
+  EXPECT_THAT(delivered, SizeIs(1));
+}
+
+}  // namespace
+}  // namespace halvox::analysis
