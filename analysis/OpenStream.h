@@ -35,10 +35,12 @@ class OpenStream {
   void setSerial(std::int64_t serial) { story_.objectSerial = serial; }
 
   // The builder's notes: the place of this stream in the builder's list, its key in the index by
-  // program, and the time at which its session ended. The time is set only if the session ended
-  // while the stream ran and the reason is not known yet.
+  // program, whether the story has only the beginning of the application's name, and the time at
+  // which its session ended. The time is set only if the session ended while the stream ran and the
+  // reason is not known yet.
   std::list<std::unique_ptr<OpenStream>>::iterator place{};
   std::uint64_t program = 0;
+  bool isApplicationCut = false;
   std::optional<double> undecidedSince{};
 
  private:

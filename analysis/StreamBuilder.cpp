@@ -42,10 +42,19 @@ bool isAnotherProcess(const ServiceTimes& last, const ServiceTimes& now) {
   const double startChange = now.start - last.start;
   if (now.uptime < last.uptime - kDisorder || std::abs(startChange) > 2 * kRounding) return true;
   // The process began after the last message. If only the clock was set, the start by the machine's
-  // uptime did not change with it.
+  // uptime did not change with it. A process that was younger than a tick at the last message also
+  // seems to have begun after it, but its start by the wall clock has not changed.
   const double passed = now.stamp - last.stamp;
   const double wallChange = passed - (now.uptime - last.uptime);
-  return now.uptime <= passed + kTick && std::abs(wallChange - startChange) <= kRounding;
+  return wallChange > kTick && now.uptime <= passed + kTick &&
+         std::abs(wallChange - startChange) <= kRounding;
+}
+
+// True if the stream is, as far as is known, of this application.
+bool mayBeOf(const OpenStream& stream, std::string_view application) {
+  const std::string_view known = stream.story().application;
+  if (application.empty() || known.empty()) return true;
+  return stream.isApplicationCut ? application.starts_with(known) : application == known;
 }
 
 std::uint64_t programOf(std::string_view application, std::string_view service) {
@@ -84,6 +93,9 @@ void StreamBuilder::onMessage(const Message& message) {
   if (isEndReport(message)) return;
   streams_.splice(streams_.end(), streams_, stream->place);
   stream->add(message, payload_);
+  if (!message.application.empty()) {
+    stream->isApplicationCut = message.application.size() > kLongestStoryText;
+  }
   noteProgram(*stream, message);
 }
 
@@ -132,15 +144,12 @@ OpenStream* StreamBuilder::findBySerial(std::int64_t serial, const Message& mess
     OpenStream& stream = *place->second;
     const StreamStory& story = stream.story();
     if (message.sessionID && story.sessionID && message.sessionID != story.sessionID) continue;
-    if (!message.application.empty() && !story.application.empty() &&
-        !std::string_view(message.application).starts_with(story.application)) {
-      continue;
-    }
+    if (!mayBeOf(stream, message.application)) continue;
     // A session that has ended takes no more messages. A first run after another run belongs to
     // another stream, which got the same serial after a restart of PipeWire.
     const bool isFirstRun = message.type == "Start" && payload_.integer("run") == 1;
     if (stream.undecidedSince || (isFirstRun && stream.hasStarted())) {
-      close(stream, StreamEnd::kStopped, 0);
+      close(stream, StreamEnd::kStopped, stream.undecidedSince.value_or(0));
       return nullptr;
     }
     return &stream;

@@ -135,6 +135,14 @@ TEST_F(StreamBuilderTest, ARestartWithinAFractionOfASecondIsNoticed) {
   EXPECT_THAT(stories, SizeIs(2));
 }
 
+TEST_F(StreamBuilderTest, AMessageDirectlyAfterTheStartOfTheServiceIsNotBeforeARestart) {
+  records.restartService(0.01);
+  start(0, stream());
+  volume(1, stream(), 0.5, true);
+
+  EXPECT_EQ(story().messages, 2U);
+}
+
 TEST_F(StreamBuilderTest, AClockThatIsSetIsNotARestart) {
   start(0, stream());
   for (const double step : {-3600.0, -1.0, 5.0, 3600.0}) {
@@ -313,6 +321,33 @@ TEST_F(StreamBuilderTest, ASerialThatRunsForTheFirstTimeAgainIsAnotherStream) {
   build();
   ASSERT_THAT(stories, SizeIs(2));
   EXPECT_EQ(stories[0].end, StreamEnd::kStopped);
+}
+
+TEST_F(StreamBuilderTest, ASessionThatEndedRanUntilThenEvenIfItsSerialIsUsedAgain) {
+  start(0, stream());
+  at(5);
+  records.summary(stream());
+  volume(5.5, stream(), 0.5, true);
+
+  build();
+  ASSERT_THAT(stories, SizeIs(2));
+  EXPECT_EQ(stories[0].end, StreamEnd::kStopped);
+  EXPECT_DOUBLE_EQ(stories[0].ended, kBegin + 5);
+  EXPECT_DOUBLE_EQ(stories[0].ranSeconds, 5);
+}
+
+TEST_F(StreamBuilderTest, AnEqualSerialOfAProgramWithALongerNameIsAnotherStream) {
+  // Each user has a PipeWire server of his own, which counts its serials from the beginning.
+  auto shorter = stream(44, "mpv");
+  auto longer = stream(44, "mpv-nightly");
+  shorter.sessionID.reset();
+  longer.sessionID.reset();
+  start(0, shorter);
+  start(1, longer, 2);
+
+  build();
+  ASSERT_THAT(stories, SizeIs(2));
+  EXPECT_EQ(stories[0].application, "mpv");
 }
 
 TEST_F(StreamBuilderTest, TwoReportersMayUseOneSerial) {

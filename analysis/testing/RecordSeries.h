@@ -32,8 +32,8 @@ class RecordSeries final : public RecordSource {
   }
   // Sets the clock, which the machine's uptime does not follow.
   void setClock(double time) { time_ = time; }
-  // The service ends and starts anew.
-  void restartService() { processStart_ = uptime_ - 0.5; }
+  // The service ends and starts anew, `ago` seconds before now.
+  void restartService(double ago = 0.5) { processStart_ = uptime_ - ago; }
 
   // Adds the records of one message. `members` are the members of its payload, as JSON.
   void message(const Sender& sender, const std::string& category, const std::string& type,
