@@ -260,7 +260,9 @@ void StreamBuilder::closeAll(StreamEnd end, double time) {
 void StreamBuilder::finish(const Finish& finish) {
   join_.finish();
   settleUndecided(lastTime_ + 2 * kSameMoment);
-  if (finish.serviceIsGone) {
+  // A service that was started anew may not have recorded anything yet.
+  const bool isAnother = finish.service && service_ && isAnotherProcess(*service_, *finish.service);
+  if (finish.serviceIsGone || isAnother) {
     closeAll(StreamEnd::kServiceGone, lastTime_);
   } else {
     closeAll(StreamEnd::kStillRunning, finish.now.value_or(lastTime_));

@@ -52,20 +52,23 @@ class StreamBuilder {
   // and ends with kEnded, directly before it is delivered.
   using MomentCallback = std::function<void(const StreamStory&, const StreamMoment&)>;
 
-  // What is known when all records are read.
-  struct Finish {
-    // Streams that run, run until then; empty: until the last record.
-    std::optional<double> now{};
-    // True if no service runs that could still write. Whatever is open has then lost its service.
-    bool serviceIsGone = false;
-  };
-
   // What a message says of the service's process: its time stamp, the process's uptime, and when it
   // started by the machine's uptime, all in seconds.
   struct ServiceTimes {
     double stamp = 0;
     double uptime = 0;
     double start = 0;
+  };
+
+  // What is known when all records are read.
+  struct Finish {
+    // Streams that run, run until then; empty: until the last record.
+    std::optional<double> now{};
+    // True if no service runs that could still write. Whatever is open has then lost its service.
+    bool serviceIsGone = false;
+    // The service that runs now. If it is another process than that of the last message, whatever
+    // is open has lost its service, too.
+    std::optional<ServiceTimes> service{};
   };
 
   explicit StreamBuilder(StoryCallback onStory, MomentCallback onMoment = nullptr);

@@ -90,6 +90,28 @@ TEST_F(StreamBuilderTest, AStreamThatRunsWhenNoServiceDoesHasLostIt) {
   EXPECT_EQ(stories[1].end, StreamEnd::kStopped);
 }
 
+// The service of the series started 100 seconds after the machine and 100 before kBegin.
+TEST_F(StreamBuilderTest, AStreamLostItsServiceIfAnotherProcessRunsNow) {
+  start(0, stream());
+  at(5).message(session(), "Session_Playback", "Start");
+
+  build({.now = kBegin + 60,
+         .service = StreamBuilder::ServiceTimes{.stamp = kBegin + 60, .uptime = 40, .start = 220}});
+  ASSERT_THAT(stories, SizeIs(2));
+  EXPECT_EQ(stories[0].end, StreamEnd::kServiceGone);
+  EXPECT_DOUBLE_EQ(stories[0].ranSeconds, 5);
+}
+
+TEST_F(StreamBuilderTest, AStreamStillRunsIfTheSameProcessDoes) {
+  start(0, stream());
+
+  build(
+      {.now = kBegin + 60,
+       .service = StreamBuilder::ServiceTimes{.stamp = kBegin + 60, .uptime = 160, .start = 100}});
+  EXPECT_EQ(story().end, StreamEnd::kStillRunning);
+  EXPECT_DOUBLE_EQ(story().ranSeconds, 60);
+}
+
 TEST_F(StreamBuilderTest, ARestartOfTheServiceEndsWhatRanAndBeginsAnotherStory) {
   start(0, stream());
   volume(0, stream(), 0.5, true);

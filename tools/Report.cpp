@@ -14,7 +14,6 @@
 #include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/runtime/Version.h"
 #include "platform/linux/store/reading/StoreReader.h"
-#include "platform/linux/store/reading/StoreUse.h"
 #include "platform/value.h"
 #include "tools/Complaint.h"
 #include "tools/JsonText.h"
@@ -23,6 +22,7 @@
 #include "tools/ReportPage.h"
 #include "tools/ServiceConfiguration.h"
 #include "tools/StoreRun.h"
+#include "tools/StreamFinish.h"
 #include "tools/TraceResults.h"
 
 namespace halvox::tools {
@@ -34,7 +34,6 @@ using platform::linux_::errnoText;
 using platform::linux_::Failure;
 using platform::linux_::Result;
 using platform::linux_::StoreReader;
-using platform::linux_::StoreUse;
 
 constexpr std::string_view kStandardOutput = "-";
 
@@ -127,15 +126,15 @@ Result<void> writeFile(const std::filesystem::path& file, std::string_view page)
 }
 
 // How streams end that nothing ended, as `halvoxctl streams` has it.
-analysis::StreamBuilder::Finish finishOf(const WriteReport& request, StoreUse use) {
-  const double present = now();
+analysis::StreamBuilder::Finish finishOf(const WriteReport& request,
+                                         const std::filesystem::path& directory) {
   // What came after the period is not known.
-  if (request.until && *request.until < present) return {.now = request.until};
-  return {.now = use == StoreUse::kServed ? std::optional(present) : std::nullopt,
-          .serviceIsGone = use == StoreUse::kNotServed};
+  if (request.until && *request.until < now()) return {.now = request.until};
+  return streamFinish(directory);
 }
 
-Result<ReportData> readRecords(const WriteReport& request, StoreReader& reader, StoreUse use) {
+Result<ReportData> readRecords(const WriteReport& request, StoreReader& reader,
+                               const std::filesystem::path& directory) {
   analysis::StoreRecordSource source(reader);
   analysis::ReportBuilder builder;
   const auto read = source.forEach({.since = request.since,
@@ -146,7 +145,7 @@ Result<ReportData> readRecords(const WriteReport& request, StoreReader& reader, 
                                     .snapshots = true},
                                    [&](const analysis::Record& record) { builder.add(record); });
   if (!read) return read.error();
-  return builder.finish(finishOf(request, use));
+  return builder.finish(finishOf(request, directory));
 }
 
 }  // namespace
@@ -162,12 +161,11 @@ ExitStatus writeReport(const WriteReport& request, const CommonOptions& options,
   const auto directory = storeDirectory(request.database, complain);
   if (const auto* status = std::get_if<ExitStatus>(&directory)) return *status;
   const auto& path = std::get<std::filesystem::path>(directory);
-  const StoreUse use = platform::linux_::storeUse(path);
   StoreReader reader;
   if (const auto opened = reader.open(path); !opened) {
     return complain(ExitStatus::kNoService, opened.error().message, "no-store");
   }
-  auto data = readRecords(request, reader, use);
+  auto data = readRecords(request, reader, path);
   if (!data) return complain(ExitStatus::kNoService, data.error().message, "no-store");
   ReportFrame frame{.program = "halvoxctl " + std::string(platform::linux_::halvoxVersion()),
                     .store = (path / "halvox.db").native(),

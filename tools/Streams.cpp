@@ -1,7 +1,6 @@
 #include "tools/Streams.h"
 
 #include <algorithm>
-#include <chrono>
 #include <filesystem>
 #include <map>
 #include <utility>
@@ -11,9 +10,10 @@
 #include "analysis/StreamBuilder.h"
 #include <fnmatch.h>
 
-#include "platform/linux/store/reading/StoreUse.h"
+#include "platform/linux/store/reading/StoreReader.h"
 #include "tools/Complaint.h"
 #include "tools/StoreRun.h"
+#include "tools/StreamFinish.h"
 #include "tools/StreamText.h"
 #include "tools/TextTable.h"
 #include "tools/TimeText.h"
@@ -26,8 +26,6 @@ using analysis::StreamEnd;
 using analysis::StreamMoment;
 using analysis::StreamStory;
 using platform::linux_::StoreReader;
-using platform::linux_::StoreUse;
-using platform::linux_::storeUse;
 
 // What is read at once for `show`. A stream with more moments is shown without the rest.
 constexpr std::size_t kMostMoments = 10'000;
@@ -65,11 +63,6 @@ bool isSelected(const ShowStreams& request, const StreamStory& story) {
          });
 }
 
-double now() {
-  // The store has times of the wall clock.
-  return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-}
-
 // Reads all messages of a store, and gives the stories. All of them: a stream that ran at some time
 // may have begun long before it.
 ExitStatus readStories(const std::string& database, const Complaint& complain,
@@ -78,7 +71,6 @@ ExitStatus readStories(const std::string& database, const Complaint& complain,
   const auto directory = storeDirectory(database, complain);
   if (const auto* status = std::get_if<ExitStatus>(&directory)) return *status;
   const auto& path = std::get<std::filesystem::path>(directory);
-  const StoreUse use = storeUse(path);
   StoreReader reader;
   const auto opened = reader.open(path);
   if (!opened) return complain(ExitStatus::kNoService, opened.error().message, "no-store");
@@ -87,9 +79,7 @@ ExitStatus readStories(const std::string& database, const Complaint& complain,
   const auto read =
       source.forEach({}, [&](const analysis::Record& record) { builder.add(record); });
   if (!read) return complain(ExitStatus::kNoService, read.error().message, "no-store");
-  // While a service runs, its streams run until now. Of a copied database nobody knows.
-  builder.finish({.now = use == StoreUse::kServed ? std::optional(now()) : std::nullopt,
-                  .serviceIsGone = use == StoreUse::kNotServed});
+  builder.finish(streamFinish(path));
   return ExitStatus::kDone;
 }
 

@@ -51,6 +51,20 @@ TEST_F(StreamsTest, SelectsByApplication) {
   EXPECT_THAT(out_.str(), Not(HasSubstr("player")));
 }
 
+TEST_F(StreamsTest, AStreamOfAServiceThatWasStartedAnewDoesNotRun) {
+  // This process has the store open. The stored message is of one that started before the machine
+  // did.
+  store("com.tarno.generic.Session_Playback.Start", {{"run", 1},
+                                                     {"object_serial", 44},
+                                                     {"hvreporting_timestamp", 100.0},
+                                                     {"systemuptime_sec", 50},
+                                                     {"processuptime_ms", 100'000}});
+
+  EXPECT_EQ(list({}, OutputForm::kJson), ExitStatus::kDone);
+  EXPECT_THAT(out_.str(), HasSubstr("\"end\":\"service gone\""));
+  EXPECT_THAT(out_.str(), HasSubstr("\"ended\":100"));
+}
+
 TEST_F(StreamsTest, ShowsTheMomentsOfOneStream) {
   storeRun("player", true);
   storeRun("player", false);

@@ -1,5 +1,8 @@
 #include "platform/linux/store/reading/StoreUse.h"
 
+#include <unistd.h>
+
+#include "platform/linux/base/ProcessStat.h"
 #include "platform/linux/store/StoreFixture.h"
 
 namespace halvox::platform::linux_ {
@@ -13,20 +16,25 @@ constexpr const char* kLocks =
 class StoreUseTest : public StoreFixture {};
 
 TEST_F(StoreUseTest, FindsTheLockOfAnInode) {
-  EXPECT_TRUE(isLocked(kLocks, 131402));
+  EXPECT_EQ(lockHolder(kLocks, 131402), 4711);
   // A lock of another kind, one that a process only waits for, and none.
-  EXPECT_FALSE(isLocked(kLocks, 7));
-  EXPECT_FALSE(isLocked(kLocks, 99));
-  EXPECT_FALSE(isLocked("", 7));
-  EXPECT_FALSE(isLocked("FLOCK\n2: FLOCK\n\n3: FLOCK  ADVISORY  WRITE 1 x:y:z", 7));
+  EXPECT_EQ(lockHolder(kLocks, 7), std::nullopt);
+  EXPECT_EQ(lockHolder(kLocks, 99), std::nullopt);
+  EXPECT_EQ(lockHolder("", 7), std::nullopt);
+  EXPECT_EQ(lockHolder("FLOCK\n2: FLOCK\n\n3: FLOCK  ADVISORY  WRITE 1 x:y:z", 7), std::nullopt);
 }
 
 TEST_F(StoreUseTest, KnowsWhetherAServiceHasTheStoreOpen) {
-  EXPECT_EQ(storeUse(options.directory), StoreUse::kUnknown);
+  EXPECT_EQ(storeServer(options.directory).use, StoreUse::kUnknown);
   start();
-  EXPECT_EQ(storeUse(options.directory), StoreUse::kServed);
+  EXPECT_EQ(storeServer(options.directory).use, StoreUse::kServed);
+  // In this test the service is this process.
+  const auto own = readOwnProcessStat();
+  ASSERT_TRUE(own.has_value());
+  EXPECT_EQ(storeServer(options.directory).start,
+            static_cast<double>(own->startTicks) / static_cast<double>(::sysconf(_SC_CLK_TCK)));
   stop();
-  EXPECT_EQ(storeUse(options.directory), StoreUse::kNotServed);
+  EXPECT_EQ(storeServer(options.directory).use, StoreUse::kNotServed);
 }
 
 }  // namespace

@@ -1,0 +1,42 @@
+#include "tools/StreamFinish.h"
+
+#include <chrono>
+#include <ctime>
+
+#include "platform/linux/store/reading/StoreUse.h"
+
+namespace halvox::tools {
+namespace {
+
+using analysis::StreamBuilder;
+using platform::linux_::StoreUse;
+
+// The clock by which services count the machine's uptime.
+double machineUptime() {
+  constexpr double kNanosecondsPerSecond = 1e9;
+  timespec time{};
+  ::clock_gettime(CLOCK_BOOTTIME, &time);
+  return static_cast<double>(time.tv_sec) +
+         static_cast<double>(time.tv_nsec) / kNanosecondsPerSecond;
+}
+
+}  // namespace
+
+StreamBuilder::Finish streamFinish(const std::filesystem::path& directory) {
+  const auto server = platform::linux_::storeServer(directory);
+  // Of a copied database nobody knows.
+  if (server.use != StoreUse::kServed) {
+    return {.serviceIsGone = server.use == StoreUse::kNotServed};
+  }
+  // While a service runs, its streams run until now. The store has times of the wall clock.
+  const double now =
+      std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+  StreamBuilder::Finish finish{.now = now};
+  if (server.start) {
+    finish.service = StreamBuilder::ServiceTimes{
+        .stamp = now, .uptime = machineUptime() - *server.start, .start = *server.start};
+  }
+  return finish;
+}
+
+}  // namespace halvox::tools
