@@ -38,11 +38,11 @@ class EventName {
   std::size_t length_ = 0;
 };
 
-AnalyticsPayload makePayload(const Message& message, const HVReportingSession& session) {
+// `message` shares its entries with the messages of the other bridges and of the session until it
+// is changed here.
+AnalyticsPayload makePayload(const Dictionary& message, const HVReportingSession& session) {
   static const Key key("HostApplicationDisplayID");
-  // A copy that shares the message's entries until it is changed, because every bridge and session
-  // has the same message.
-  Dictionary payload = message.value_or(Dictionary{});
+  Dictionary payload = message;
   platform::Value name = HVReportingUtilityRetrieveAppName(session.configuration());
   if (payload.find(key) == nullptr) return {std::move(payload), {key, std::move(name)}};
   // Replaces what the message itself has under this key, because only the session's configuration
@@ -55,8 +55,13 @@ void sendIfUsed(std::string_view name, const Message& message,
                 const std::shared_ptr<HVReportingSession>& session) {
   platform::AnalyticsService& analytics = platform::analytics();
   if (!analytics.isAnalyticsEventUsed(name)) return;
-  analytics.sendAnalyticsEventLazy(name,
-                                   [message, session] { return makePayload(message, *session); });
+  // The captures are copies without const. A plain capture of a const reference would be a const
+  // member, which cannot be moved, and the builder would be allocated for each event.
+  auto builder = [entries = message.value_or(Dictionary()), session = std::shared_ptr(session)] {
+    return makePayload(entries, *session);
+  };
+  static_assert(platform::AnalyticsPayloadBuilder::holdsInside<decltype(builder)>());
+  analytics.sendAnalyticsEventLazy(name, std::move(builder));
 }
 
 }  // namespace

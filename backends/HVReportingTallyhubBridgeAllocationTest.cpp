@@ -1,5 +1,8 @@
+#include <array>
 #include <cstddef>
 #include <memory>
+#include <string_view>
+#include <utility>
 
 #include <gtest/gtest.h>
 
@@ -28,24 +31,54 @@ class UnusedAnalyticsService final : public platform::AnalyticsService {
   int sent = 0;
 };
 
-TEST(HVReportingTallyhubBridgeAllocationTest, AMessageThatNobodyCollectsAllocatesNothing) {
-  platform::FakePlatform fakes;
-  UnusedAnalyticsService analytics;
-  platform::installServices(fakes.servicesWith(analytics));
-  const auto session = std::make_shared<HVReportingSession>(
+// Collects every event, and keeps the builders in memory that it already has.
+class KeepingAnalyticsService final : public platform::AnalyticsService {
+ public:
+  bool isAnalyticsEventUsed(std::string_view /*eventName*/) override { return true; }
+  void sendAnalyticsEventLazy(std::string_view /*eventName*/,
+                              platform::AnalyticsPayloadBuilder builder) override {
+    builders.at(sent++) = std::move(builder);
+  }
+  std::array<platform::AnalyticsPayloadBuilder, 2> builders;
+  std::size_t sent = 0;
+};
+
+class HVReportingTallyhubBridgeAllocationTest : public testing::Test {
+ protected:
+  // The allocations of one message.
+  std::size_t allocationsWith(platform::AnalyticsService& analytics) {
+    platform::installServices(fakes_.servicesWith(analytics));
+    const std::size_t before = platform::allocationsOfThisThread();
+    EXPECT_GT(before, 0U);  // the counter works
+    HVReportingTallyhubBridge::handleEvent(
+        message_, AudioEventCategory::kSession | AudioEventCategory::kPlaybackAndRecord,
+        AudioEventType::kHeadphoneAudioExposure, session_);
+    return platform::allocationsOfThisThread() - before;
+  }
+
+  platform::FakePlatform fakes_;
+  const std::shared_ptr<HVReportingSession> session_ = std::make_shared<HVReportingSession>(
       ReporterID{7}, HVReportingSession::ProcessIdentifiers{12},
-      SessionCounters::make(fakes.statistics));
-  const platform::Message message = platform::Dictionary{{"a", 1}};
+      SessionCounters::make(fakes_.statistics));
+  const platform::Message message_ = platform::Dictionary{{"a", 1}};
+};
 
-  const std::size_t before = platform::allocationsOfThisThread();
-  ASSERT_GT(before, 0U);  // the counter works
-  HVReportingTallyhubBridge::handleEvent(
-      message, AudioEventCategory::kSession | AudioEventCategory::kPlaybackAndRecord,
-      AudioEventType::kHeadphoneAudioExposure, session);
+TEST_F(HVReportingTallyhubBridgeAllocationTest, AMessageThatNobodyCollectsAllocatesNothing) {
+  UnusedAnalyticsService analytics;
 
-  EXPECT_EQ(platform::allocationsOfThisThread() - before, 0U);
+  EXPECT_EQ(allocationsWith(analytics), 0U);
+
   EXPECT_EQ(analytics.asked, 2);
   EXPECT_EQ(analytics.sent, 0);
+}
+
+TEST_F(HVReportingTallyhubBridgeAllocationTest, TheBuildersOfCollectedEventsAllocateNothing) {
+  KeepingAnalyticsService analytics;
+
+  EXPECT_EQ(allocationsWith(analytics), 0U);
+
+  ASSERT_EQ(analytics.sent, 2U);
+  EXPECT_EQ(*analytics.builders[1]().find("a"), platform::Value(1));
 }
 
 }  // namespace

@@ -51,6 +51,13 @@ class InlineFunction<Result(Arguments...), Bytes> {
   InlineFunction& operator=(const InlineFunction&) = delete;
   ~InlineFunction() { reset(); }
 
+  // True if a function of that type is stored without an allocation. A lambda that captures a const
+  // variable by copy may not be: a const member cannot be moved, and copying it may throw.
+  template <typename Function>
+  [[nodiscard]] static constexpr bool holdsInside() {
+    return fits<std::remove_cvref_t<Function>>();
+  }
+
   [[nodiscard]] explicit operator bool() const { return operations_ != nullptr; }
   Result operator()(Arguments... arguments) {
     return operations_->call(storage_, std::forward<Arguments>(arguments)...);

@@ -68,6 +68,19 @@ TEST(InlineFunctionTest, CallsAFunctionThatDoesNotFitInside) {
   EXPECT_EQ(second(63), 7);
 }
 
+TEST(InlineFunctionTest, SaysWhatItHoldsInside) {
+  const auto text = std::make_shared<std::string>("a");
+  const std::string copied = "b";
+  const auto fitting = [text = std::shared_ptr(text)](int) { return 1; };
+  const auto large = [bytes = std::array<char, 33>{}](int) { return 1 + bytes[0]; };
+  // The captured string is const and can only be copied, which may throw.
+  const auto constant = [copied](int) { return static_cast<int>(copied.size()); };
+
+  EXPECT_TRUE(Function::holdsInside<decltype(fitting)>());
+  EXPECT_FALSE(Function::holdsInside<decltype(large)>());
+  EXPECT_FALSE(Function::holdsInside<decltype(constant)>());
+}
+
 TEST(InlineFunctionTest, AssignmentReleasesThePreviousFunction) {
   const auto held = std::make_shared<int>(1);
   Function function = [held](int) { return 0; };
