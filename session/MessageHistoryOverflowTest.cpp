@@ -45,6 +45,15 @@ class MessageHistoryOverflowTest : public testing::Test {
       ++outcomes_[history_.record(kPlayback, kStart, messageOf(number))];
     }
   }
+  // Each message ends an interval of a second, for which there is a volume message.
+  void recordVolumes(int first, int end) {
+    for (int number = first; number < end; ++number) {
+      const Dictionary message{{"RQSessionVolume", number % 2 == 0 ? 0.25 : 0.75},
+                               {"RQSessionVolumePlayingState", 1},
+                               {"hvreporting_timestamp", number + 0.123456}};
+      ++outcomes_[history_.record(kPlayback, kStart, message)];
+    }
+  }
   std::vector<RecordedMessage> recorded() {
     const auto history = history_.lock();
     return messagesOf(**history);
@@ -134,6 +143,33 @@ TEST_F(MessageHistoryOverflowTest, AClientOverItsShareMovesEvenShortHistories) {
 
   EXPECT_GE(platform_.overflow.keptBytes(), 90 * kTextBytes);
   EXPECT_EQ(recorded().size(), 100U);
+}
+
+TEST_F(MessageHistoryOverflowTest, VolumeMessagesDoNotMakeMessagesMoveOneByOne) {
+  platform_.overflow.setMemoryPerClient(0);
+  history_.begin();
+
+  recordVolumes(0, 1000);
+
+  EXPECT_GE(platform_.overflow.keptPieces(), 2U);
+  EXPECT_LE(platform_.overflow.keptPieces(), 30U);
+  EXPECT_EQ(recorded().size(), 1000U);
+}
+
+TEST_F(MessageHistoryOverflowTest, AMessageIsKeptIfOnlyTheVolumeMessagesCannotBeMoved) {
+  history_.begin();
+  recordVolumes(0, 1000);  // both parts have some kilobytes now
+  outcomes_.clear();
+  platform_.overflow.setMemoryPerClient(0);
+  platform_.overflow.setWriteError(platform::Error{.description = "disk full"}, 1);
+
+  recordVolumes(1000, 1010);
+
+  EXPECT_EQ(platform_.overflow.keptPieces(), 1U);
+  EXPECT_EQ(platform_.overflow.failedWrites(), 1U);
+  EXPECT_EQ(outcomes_[Outcome::kRecorded], 10U);
+  EXPECT_EQ(outcomes_[Outcome::kNoRoom], 0U);
+  EXPECT_EQ(recorded().size(), 1010U);
 }
 
 TEST_F(MessageHistoryOverflowTest, AFullDiskCostsTheHistoryMessagesAndNothingElse) {

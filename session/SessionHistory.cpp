@@ -100,10 +100,15 @@ SessionHistory::Outcome SessionHistory::recordLocked(const Lock& history,
 
 // When a history takes much memory, it goes on in a file. It loses a message only if writing the
 // file fails, for instance because the disk is full.
+//
+// The messages and the volume messages are moved separately, each if it is worth a write of its
+// own. If their sizes were added, a few volume messages would make a client over its share move
+// every message alone.
 bool SessionHistory::makeRoom(MessageHistory& messages) {
-  const std::size_t movable = messages.movableSize() + volumes_->movableSize();
-  if (movable < kLeastToMove) return true;
-  if (movable < kMostInMemory && !isClientOverItsShare()) return true;
+  const std::size_t movable = messages.movableSize();
+  const std::size_t movableVolumes = volumes_->movableSize();
+  if (movable < kLeastToMove && movableVolumes < kLeastToMove) return true;
+  if (movable + movableVolumes < kMostInMemory && !isClientOverItsShare()) return true;
   return tryToMoveOut(messages);
 }
 
@@ -111,10 +116,15 @@ bool SessionHistory::makeRoom(MessageHistory& messages) {
 // of 64 KiB is not repeated for each message.
 bool SessionHistory::tryToMoveOut(MessageHistory& messages) {
   const std::chrono::milliseconds now = platform::clock().processUptime();
-  if (now < nextTry_) return false;
-  auto error = messages.moveOut();
-  if (!error.has_value() && volumes_->movableSize() >= kLeastToMove) error = volumes_->moveOut();
-  if (!error.has_value()) return true;
+  const bool isRoomNeeded = messages.movableSize() >= kLeastToMove;
+  if (now < nextTry_) return !isRoomNeeded;
+  auto error = isRoomNeeded ? messages.moveOut() : std::nullopt;
+  if (!error.has_value()) {
+    // The message has room now. If the volume messages cannot be moved, they stay in memory: there
+    // are at most two a second, and they grow only while messages are recorded.
+    if (volumes_->movableSize() >= kLeastToMove && volumes_->moveOut()) nextTry_ = now + kRetryTime;
+    return true;
+  }
   nextTry_ = now + kRetryTime;
   if (messages.lost() == 0) {
     kSessionLog.error("cannot move the history of reporter ", number(reporterID_),

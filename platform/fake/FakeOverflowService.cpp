@@ -11,9 +11,10 @@ void FakeOverflowService::setMemoryPerClient(std::size_t bytes) {
   memoryPerClient_ = bytes;
 }
 
-void FakeOverflowService::setWriteError(std::optional<Error> error) {
+void FakeOverflowService::setWriteError(std::optional<Error> error, std::size_t writes) {
   const std::lock_guard lock(mutex_);
   writeError_ = std::move(error);
+  writesBeforeError_ = writes;
 }
 
 void FakeOverflowService::setReadError(std::optional<Error> error) {
@@ -35,6 +36,11 @@ std::size_t FakeOverflowService::keptBytes() const {
   return bytes;
 }
 
+std::size_t FakeOverflowService::keptPieces() const {
+  const std::lock_guard lock(mutex_);
+  return pieces_.size();
+}
+
 std::size_t FakeOverflowService::failedWrites() const {
   const std::lock_guard lock(mutex_);
   return failedWrites_;
@@ -49,8 +55,11 @@ std::optional<Error> FakeOverflowService::write(std::span<const std::byte> bytes
                                                 OverflowPlace& place) {
   const std::lock_guard lock(mutex_);
   if (writeError_.has_value()) {
-    ++failedWrites_;
-    return writeError_;
+    if (writesBeforeError_ == 0) {
+      ++failedWrites_;
+      return writeError_;
+    }
+    --writesBeforeError_;
   }
   pieces_.emplace(next_, std::vector<std::byte>(bytes.begin(), bytes.end()));
   place = {.offset = next_, .length = bytes.size()};

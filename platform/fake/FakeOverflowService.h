@@ -17,8 +17,9 @@ class FakeOverflowService final : public OverflowService {
  public:
   // 64 MiB at first.
   void setMemoryPerClient(std::size_t bytes);
-  // From now on writing, or reading, fails with that error; std::nullopt ends the failures.
-  void setWriteError(std::optional<Error> error);
+  // From now on writing, or reading, fails with that error; std::nullopt ends the failures. The
+  // first `writes` writes still succeed.
+  void setWriteError(std::optional<Error> error, std::size_t writes = 0);
   void setReadError(std::optional<Error> error);
 
   // Changes the byte at `position` in each stored piece that is long enough, like a damaged disk.
@@ -26,6 +27,8 @@ class FakeOverflowService final : public OverflowService {
 
   // The bytes that were written and not released.
   [[nodiscard]] std::size_t keptBytes() const;
+  // The number of pieces that they were written in.
+  [[nodiscard]] std::size_t keptPieces() const;
   [[nodiscard]] std::size_t failedWrites() const;
 
   [[nodiscard]] std::size_t memoryPerClient() const override;
@@ -38,6 +41,7 @@ class FakeOverflowService final : public OverflowService {
   mutable std::mutex mutex_;
   std::size_t memoryPerClient_ = std::size_t{64} * 1024 * 1024;
   std::optional<Error> writeError_;
+  std::size_t writesBeforeError_ = 0;
   std::optional<Error> readError_;
   std::size_t failedWrites_ = 0;
   std::uint64_t next_ = 0;
