@@ -37,10 +37,10 @@ std::size_t bytesOf(const LinkMessage& message) {
   const auto& [original, tagged] = message.content;
   std::size_t bytes = kWaitingOverhead + tagged.memorySize();
   if (!original.has_value()) return bytes;
-  // Normally the tagged message is the original with one more entry and shares its values. If two
-  // keys became equal or the original had a tag, some values belong to the original alone.
-  const bool sharesValues = tagged.size() == original->size() + 1;
-  bytes += sharesValues ? original->size() * sizeof(Dictionary::Entry) : original->memorySize();
+  // Normally the tagged message is the original with one more entry in the same block of memory.
+  // If keys had blanks or the original had a tag, each has a block of its own, and texts of up to
+  // 128 bytes are in both.
+  if (tagged.sharedEntries(*original) < original->size()) bytes += original->memorySize();
   return bytes;
 }
 

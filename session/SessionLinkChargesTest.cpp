@@ -1,6 +1,7 @@
 #include <chrono>
 #include <memory>
 #include <string>
+#include <vector>
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -36,6 +37,29 @@ TEST_F(SessionLinkChargesTest, ASingleMessageOfAnotherClientIsChargedToThatOne) 
 
   EXPECT_EQ(sender_->use().bytes, 0U);
   EXPECT_EQ(framework_.singleMessages().size(), 1U);
+}
+
+TEST_F(SessionLinkChargesTest, AMessageWhoseKeysWereCleanedIsChargedTwice) {
+  const auto chargeOf = [this](const std::string& key) {
+    // As the decoder makes it: the texts are in the message's own block, with room for the tag.
+    const std::string text(100, 'x');
+    std::vector<Dictionary::Entry> entries;
+    for (int number = 0; number < 8; ++number) {
+      entries.push_back({key + std::to_string(number), platform::Value::lending(text)});
+    }
+    session_->sendMessage(Dictionary(entries, 1), kPlayback, kStart, nullptr, sender_);
+    const std::size_t charged = sender_->use().bytes;
+    run();
+    platform_.dispatch.advance(1s);
+    EXPECT_EQ(sender_->use().bytes, 0U);
+    return charged;
+  };
+
+  const std::size_t withoutBlanks = chargeOf("key_");
+  const std::size_t withBlanks = chargeOf("key ");
+
+  EXPECT_GE(withoutBlanks, 800U);
+  EXPECT_GE(withBlanks, withoutBlanks + 800U);
 }
 
 TEST_F(SessionLinkChargesTest, OwnersAreChargedForTheHistoryAndSendersForWhatWaits) {
