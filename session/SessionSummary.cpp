@@ -47,13 +47,17 @@ platform::Dictionary LateSummary::makeEvent() const {
   return makeEventOf(history_, serviceType_, reporterID_);
 }
 
-// Logged once, before the first message, and only if there is one.
+// The line is logged once, after the first message was read and before it is sent. If the file of
+// the histories cannot be read, there may be no message although there were some.
 void SessionSummary::sendVolumeMessages(const Send& send) const {
   const auto messages = history_.takeVolumeMessages();
   if (messages == nullptr) return;
-  kSessionLog.notice("sending volume event for reporter ", number(profile_.reporterID()));
   MessageHistory::Reader reader(*messages);
-  while (const MessageHistory::Entry* entry = reader.next()) send(entry->message());
+  const MessageHistory::Entry* entry = reader.next();
+  if (entry != nullptr) {
+    kSessionLog.notice("sending volume event for reporter ", number(profile_.reporterID()));
+  }
+  for (; entry != nullptr; entry = reader.next()) send(entry->message());
   logIfCutShort(reader, profile_.reporterID());
 }
 

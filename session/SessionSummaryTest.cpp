@@ -182,6 +182,26 @@ TEST_F(SessionSummaryTest, VolumeIsLoggedAtDefaultLevelOnce) {
       ElementsAre("sending volume event for reporter 7", "sending summary event for reporter 7"));
 }
 
+TEST_F(SessionSummaryTest, VolumeMessagesThatCannotBeReadAreNotAnnounced) {
+  session_ = std::make_shared<HVReportingSession>(ReporterID{7},
+                                                  HVReportingSession::ProcessIdentifiers{12},
+                                                  SessionCounters::make(platform_.statistics));
+  session_->chargeTo(std::make_shared<ResourceAccount>());
+  platform_.overflow.setMemoryPerClient(0);
+  session_->start();
+  for (int number = 0; number < 1000; ++number) playing(number % 2 == 0 ? 0.25 : 0.75, number);
+  platform_.overflow.setReadError(platform::Error{.description = "bad block"});
+  platform_.log.clear();
+
+  session_->stop();
+
+  EXPECT_THAT(platform_.log.texts(platform::LogLevel::kDefault),
+              ElementsAre("sending summary event for reporter 7"));
+  EXPECT_THAT(platform_.log.texts(platform::LogLevel::kError),
+              ElementsAre("cannot read the rest of the history of reporter 7: bad block; the "
+                          "summary lacks the remaining messages"));
+}
+
 TEST_F(SessionSummaryTest, AnalyticsGetTheVolumeMessagesUntagged) {
   playTwoVolumes();
 
