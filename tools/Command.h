@@ -40,6 +40,7 @@ struct ToolStreams {
   std::ostream& errors;
   int outputDescriptor = -1;  // the descriptor of `output`; -1 if it has none
   bool isInputTerminal = false;
+  bool isErrorTerminal = false;
 };
 
 // A parsed command line: the request, in the type of its command, and the function that carries it

@@ -351,20 +351,38 @@ TEST(CommandLineTest, SqlTakesAQueryOrReadsTheInput) {
 }
 
 TEST(CommandLineTest, ExportTakesAFileAndTimes) {
-  const auto parsed =
-      parse({"export", "--format", "sqlite", "--to", "f.db", "--since", "@5", "--until", "@9.5"});
-  const auto& request = *std::get<Command>(parsed).asked<ExportRecords>();
+  const auto asked = [](const Words& words) {
+    return *std::get<Command>(parse(words)).asked<ExportRecords>();
+  };
+  const auto request =
+      asked({"export", "--format", "sqlite", "--to", "f.db", "--since", "@5", "--until", "@9.5"});
   EXPECT_EQ(request.to, "f.db");
   EXPECT_EQ(request.since, 5);
   EXPECT_EQ(request.until, 9.5);
   EXPECT_FALSE(request.replace);
-  EXPECT_TRUE(
-      std::get<Command>(parse({"export", "--to", "f", "--force"})).asked<ExportRecords>()->replace);
+  EXPECT_TRUE(asked({"export", "-o", "f", "--force"}).replace);
+  EXPECT_EQ(asked({"export", "--output", "f"}).format, ExportFormat::kSqlite);
+  EXPECT_EQ(asked({"export", "--format", "jsonl"}).to, "-");
+}
+
+TEST(CommandLineTest, ExportTakesKindsAndApplications) {
+  const auto asked = [](const Words& words) {
+    return *std::get<Command>(parse(words)).asked<ExportRecords>();
+  };
+  const auto some = asked({"export", "--format", "csv", "--kind", "power", "--kind", "link",
+                           "--app", "a*", "--app", "b"});
+  EXPECT_FALSE(some.kinds.events);
+  EXPECT_TRUE(some.kinds.power);
+  EXPECT_TRUE(some.kinds.link);
+  EXPECT_EQ(some.applications, (Words{"a*", "b"}));
+  EXPECT_TRUE(asked({"export", "--format", "csv"}).kinds.snapshots);
+  EXPECT_NE(errorOf({"export", "--kind", "event", "-o", "f"}).find("expected one of events, "),
+            std::string::npos);
 }
 
 TEST(CommandLineTest, ExportNamesTheFormsThatItHas) {
-  EXPECT_NE(errorOf({"export", "--to", "f", "--format", "csv"}).find("sqlite"), std::string::npos);
-  EXPECT_NE(errorOf({"export"}).find("--to"), std::string::npos);
+  EXPECT_NE(errorOf({"export", "--to", "f", "--format", "xml"}).find("sqlite"), std::string::npos);
+  EXPECT_NE(errorOf({"export"}).find("--output"), std::string::npos);
 }
 
 // The completion is a separate file, in which a new command is easily forgotten.

@@ -10,7 +10,8 @@ void addRequestCommands(CommandSet& commands);   // create, send, list…: one r
 void addScriptRequests(CommandSet& commands);    // wait, sleep: only in scripts
 void addScriptCommands(CommandSet& commands);    // run, shell
 void addRecordCommands(CommandSet& commands);    // events, metrics, power, link
-void addQueryCommands(CommandSet& commands);     // sql, export
+void addQueryCommands(CommandSet& commands);     // sql
+void addExportCommand(CommandSet& commands);     // export
 void addStreamCommands(CommandSet& commands);    // streams
 void addReportCommand(CommandSet& commands);     // report
 void addSnapshotCommands(CommandSet& commands);  // snapshots

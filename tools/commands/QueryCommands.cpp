@@ -1,15 +1,12 @@
 #include <memory>
-#include <string>
 
-#include "tools/Export.h"
 #include "tools/Sql.h"
 #include "tools/commands/Commands.h"
 #include "tools/commands/Selection.h"
 
 namespace halvox::tools {
-namespace {
 
-void addSql(CommandSet& commands) {
+void addQueryCommands(CommandSet& commands) {
   const auto request = std::make_shared<RunSql>();
   CLI::App& sql = commands.add(
       {.name = "sql",
@@ -26,34 +23,6 @@ void addSql(CommandSet& commands) {
   addDatabase(sql, request->database);
   commands.onRun(
       sql, [request] { return *request; }, runSql);
-}
-
-void addExport(CommandSet& commands) {
-  const auto request = std::make_shared<ExportRecords>();
-  const auto format = std::make_shared<std::string>("sqlite");
-  CLI::App& exporting =
-      commands.add({.name = "export",
-                    .summary = "Write the stored records into a plain SQLite database",
-                    .example = "halvoxctl export --format sqlite --to records.db --since today",
-                    .reach = CommandReach::kFiles});
-  exporting
-      .add_option("--format", *format,
-                  "The form of the file: sqlite, a database with five plain tables (default)")
-      ->type_name("FORM")
-      ->check(CLI::IsMember({"sqlite"}));
-  exporting.add_option("--to", request->to, "The file to write")->type_name("FILE")->required();
-  exporting.add_flag("--force", request->replace, "Replace the file if it exists");
-  addTimes(exporting, request->since, request->until, "records");
-  addDatabase(exporting, request->database);
-  commands.onRun(
-      exporting, [request, format] { return *request; }, exportRecords);
-}
-
-}  // namespace
-
-void addQueryCommands(CommandSet& commands) {
-  addSql(commands);
-  addExport(commands);
 }
 
 }  // namespace halvox::tools

@@ -1,8 +1,8 @@
 #include "platform/linux/store/reading/StoreExport.h"
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
-#include <cstddef>
 #include <fstream>
 #include <span>
 #include <string>
@@ -15,13 +15,20 @@
 namespace halvox::platform::linux_ {
 namespace {
 
-// The names of the other tables of an export, and the tables of the store from which their records
-// come.
-constexpr std::array<std::pair<std::string_view, const RecordTable*>, 4> kKinds{
-    {{"issue_metrics", &kIssueMetrics},
+// The names of the tables of an export, and the kinds of their records. null: the events.
+constexpr std::array<std::pair<std::string_view, const RecordTable*>, 5> kKinds{
+    {{"analytics_events", nullptr},
+     {"issue_metrics", &kIssueMetrics},
      {"power_events", &kPowerEvents},
      {"link_messages", &kLinkMessages},
      {"snapshots", &kSnapshots}}};
+
+constexpr std::array kEventColumns{RecordColumn{"name", ColumnType::kText},
+                                   RecordColumn{"payload", ColumnType::kText}};
+
+std::span<const RecordColumn> columnsOf(const RecordTable* kind) {
+  return kind == nullptr ? std::span<const RecordColumn>(kEventColumns) : kind->columns;
+}
 
 std::string_view typeName(ColumnType type) {
   switch (type) {
@@ -35,13 +42,32 @@ std::string_view typeName(ColumnType type) {
   return {};
 }
 
-std::string createTable(std::string_view name, const RecordTable& table) {
-  std::string sql = "CREATE TABLE " + std::string(name) + "(time REAL NOT NULL";
-  for (const RecordColumn& column : table.columns) {
-    sql.append(", ").append(column.name).append(" ").append(typeName(column.type));
-    sql += " NOT NULL";
+// SQLite stores NULL for a text with a null pointer, which an empty view may have.
+std::string_view notNull(std::string_view text) { return text.empty() ? "" : text; }
+
+// Binds the columns after the time.
+void bindColumns(Statement& statement, const StoredItem& item) {
+  if (item.table == nullptr) {
+    statement.bind(2, notNull(item.name));
+    statement.bind(3, notNull(item.payload));
+  } else if (item.table == &kIssueMetrics) {
+    statement.bind(2, item.number);
+    statement.bind(3, std::as_bytes(std::span(item.payload)));
+  } else if (item.table == &kPowerEvents) {
+    statement.bind(2, item.number);
+    statement.bind(3, notNull(item.name));
+    statement.bind(4, notNull(item.payload));
+  } else if (item.table == &kLinkMessages) {
+    statement.bind(2, item.sessionID);
+    statement.bind(3, notNull(item.clientName));
+    statement.bind(4, notNull(item.serviceName));
+    statement.bind(5, item.number);
+    statement.bind(6, item.type);
+    statement.bind(7, notNull(item.payload));
+  } else {
+    statement.bind(2, notNull(item.payload));
+    statement.bind(3, notNull(item.path));
   }
-  return sql + ");";
 }
 
 }  // namespace
@@ -50,6 +76,7 @@ StoreExport::StoreExport(std::filesystem::path file)
     : file_(std::move(file)), part_(file_.native() + ".part") {}
 
 StoreExport::~StoreExport() {
+  tables_.clear();
   database_.close();
   std::error_code ignored;
   std::filesystem::remove(part_, ignored);
@@ -60,81 +87,44 @@ Result<void> StoreExport::create() {
   if (!std::ofstream(part_, std::ios::trunc)) {
     return Failure<>{part_.native() + ": " + errnoText(errno)};
   }
-  std::string sql =
-      // The file need not survive a crash, because a failed export is deleted.
-      "PRAGMA journal_mode = OFF; PRAGMA synchronous = OFF; BEGIN;"
-      "CREATE TABLE analytics_events(time REAL NOT NULL, name TEXT NOT NULL, payload TEXT NOT "
-      "NULL);";
-  for (const auto& [name, table] : kKinds) sql += createTable(name, *table);
-  code_ = database_.open("file:" + part_.native(), DatabaseAccess::kReadWrite);
-  if (code_ == SQLITE_OK) code_ = database_.execute(sql);
-  if (code_ != SQLITE_OK) return cannotWrite();
+  SqliteCode code = database_.open("file:" + part_.native(), DatabaseAccess::kReadWrite);
+  // The file need not survive a crash, because a failed export is deleted.
+  if (code == SQLITE_OK) {
+    code = database_.execute("PRAGMA journal_mode = OFF; PRAGMA synchronous = OFF; BEGIN");
+  }
+  for (const auto& [name, kind] : kKinds) {
+    if (code == SQLITE_OK) code = createTable(name, kind);
+  }
+  if (code != SQLITE_OK) return cannotWrite();
   return {};
 }
 
-Result<void> StoreExport::copyFrom(StoreReader& reader, const RecordFilter& filter) {
-  if (auto copied = copyEvents(reader, filter); !copied) return copied;
-  for (const auto& [name, table] : kKinds) {
-    if (auto copied = copyKind(name, *table, reader, filter); !copied) return copied;
+SqliteCode StoreExport::createTable(std::string_view name, const RecordTable* kind) {
+  std::string create = "CREATE TABLE " + std::string(name) + "(time REAL NOT NULL";
+  std::string insert = "INSERT INTO " + std::string(name) + " VALUES (?";
+  for (const RecordColumn& column : columnsOf(kind)) {
+    create.append(", ").append(column.name).append(" ").append(typeName(column.type));
+    create += " NOT NULL";
+    insert += ", ?";
   }
-  return {};
+  const SqliteCode code = database_.execute(create + ")");
+  if (code != SQLITE_OK) return code;
+  return database_.prepare(insert + ")", tables_.emplace_back(Table{.kind = kind}).insert);
 }
 
-void StoreExport::insert(Statement& statement) {
-  code_ = statement.run();
-  if (code_ == SQLITE_OK) ++records_;
-}
-
-Result<void> StoreExport::copyEvents(StoreReader& reader, const RecordFilter& filter) {
-  Statement statement;
-  code_ = database_.prepare("INSERT INTO analytics_events VALUES (?1, ?2, ?3)", statement);
-  return outcome(reader.forEachEvent(filter, [&](const StoredEvent& event) {
-    if (code_ != SQLITE_OK) return;
-    statement.bind(1, event.time);
-    statement.bind(2, event.name);
-    statement.bind(3, event.payload);
-    insert(statement);
-  }));
-}
-
-Result<void> StoreExport::copyKind(std::string_view name, const RecordTable& table,
-                                   StoreReader& reader, const RecordFilter& filter) {
-  std::string sql = "INSERT INTO " + std::string(name) + " VALUES (?1";
-  for (std::size_t column = 0; column < table.columns.size(); ++column) {
-    sql += ", ?" + std::to_string(column + 2);
-  }
-  Statement statement;
-  code_ = database_.prepare(sql + ")", statement);
-  return outcome(reader.forEachRecord(table, filter, [&](const StoredRecord& record) {
-    if (code_ != SQLITE_OK) return;
-    statement.bind(1, record.time);
-    for (std::size_t column = 0; column < table.columns.size(); ++column) {
-      const int index = static_cast<int>(column) + 2;
-      switch (table.columns[column].type) {
-        case ColumnType::kInteger:
-          statement.bind(index, record.number(column));
-          break;
-        case ColumnType::kText:
-          statement.bind(index, std::string_view(record.text(column)));
-          break;
-        case ColumnType::kBytes:
-          statement.bind(index, std::as_bytes(std::span(record.text(column))));
-          break;
-      }
-    }
-    insert(statement);
-  }));
-}
-
-Result<void> StoreExport::outcome(const Result<void, StoreError>& read) const {
-  if (code_ != SQLITE_OK) return cannotWrite();
-  if (!read) return Failure<>{read.error().message};
+Result<void> StoreExport::add(const StoredItem& item) {
+  const auto table = std::ranges::find(tables_, item.table, &Table::kind);
+  if (table == tables_.end()) return {};
+  table->insert.bind(1, item.time);
+  bindColumns(table->insert, item);
+  if (table->insert.run() != SQLITE_OK) return cannotWrite();
+  ++records_;
   return {};
 }
 
 Result<void> StoreExport::finish() {
-  code_ = database_.execute("COMMIT");
-  if (code_ != SQLITE_OK) return cannotWrite();
+  if (database_.execute("COMMIT") != SQLITE_OK) return cannotWrite();
+  tables_.clear();
   database_.close();
   std::error_code error;
   std::filesystem::rename(part_, file_, error);

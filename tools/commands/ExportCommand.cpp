@@ -1,0 +1,103 @@
+#include <algorithm>
+#include <array>
+#include <memory>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "tools/Export.h"
+#include "tools/commands/Commands.h"
+#include "tools/commands/Selection.h"
+
+namespace halvox::tools {
+namespace {
+
+using platform::linux_::Failure;
+using platform::linux_::Result;
+
+constexpr const char* kStandardOutput = "-";
+
+constexpr std::array<std::pair<std::string_view, ExportFormat>, 3> kFormats{
+    {{"sqlite", ExportFormat::kSqlite},
+     {"jsonl", ExportFormat::kJsonl},
+     {"csv", ExportFormat::kCsv}}};
+constexpr std::array kKinds{ExportKind::kEvents, ExportKind::kMetrics, ExportKind::kPower,
+                            ExportKind::kLink, ExportKind::kSnapshots};
+
+Result<ExportFormat> parseFormat(std::string_view text) {
+  std::string names;
+  for (const auto& [name, format] : kFormats) {
+    if (text == name) return format;
+    names.append(names.empty() ? "" : ", ").append(name);
+  }
+  return Failure<>{"\"" + std::string(text) + "\" is not a format; expected one of " + names};
+}
+
+Result<ExportKind> parseKind(std::string_view text) {
+  std::string names;
+  for (const ExportKind kind : kKinds) {
+    if (text == wordOf(kind)) return kind;
+    names.append(names.empty() ? "" : ", ").append(wordOf(kind));
+  }
+  return Failure<>{"\"" + std::string(text) + "\" is not a kind of records; expected one of " +
+                   names};
+}
+
+ExportKinds kindsOf(const std::vector<ExportKind>& asked) {
+  if (asked.empty()) return {};
+  const auto has = [&](ExportKind kind) {
+    return std::find(asked.begin(), asked.end(), kind) != asked.end();
+  };
+  return {.events = has(ExportKind::kEvents),
+          .metrics = has(ExportKind::kMetrics),
+          .power = has(ExportKind::kPower),
+          .link = has(ExportKind::kLink),
+          .snapshots = has(ExportKind::kSnapshots)};
+}
+
+ExportRecords checked(ExportRecords request, const std::vector<ExportKind>& kinds) {
+  request.kinds = kindsOf(kinds);
+  if (request.format == ExportFormat::kSqlite && request.to == kStandardOutput) {
+    throw CLI::ValidationError("--output",
+                               "--format sqlite needs a file, such as -o records.db; the other "
+                               "formats can go to the standard output");
+  }
+  return request;
+}
+
+}  // namespace
+
+void addExportCommand(CommandSet& commands) {
+  const auto request = std::make_shared<ExportRecords>();
+  const auto kinds = std::make_shared<std::vector<ExportKind>>();
+  CLI::App& app = commands.add(
+      {.name = "export",
+       .summary = "Write the stored records in a form that other programs read",
+       .example = "halvoxctl export --since today -o records.db\n"
+                  "  halvoxctl export --format jsonl --app 'org.example.*' | jq .payload",
+       .details = "A file gets its name when it is complete. docs/export.md describes the formats.",
+       .reach = CommandReach::kFiles});
+  addParsed(app, "--format", request->format, parseFormat,
+            "sqlite: a database with five plain tables (default); jsonl: one JSON object a line; "
+            "csv: one table for spreadsheets")
+      ->type_name("FORMAT");
+  app.add_option("-o,--output,--to", request->to,
+                 "The file to write; - is the standard output (default, except for sqlite)")
+      ->type_name("FILE");
+  app.add_flag("--force", request->replace, "Replace the file if it exists");
+  addEach(app, "--kind", *kinds, parseKind,
+          "Only records of this kind: events, metrics, power, link or snapshots")
+      ->type_name("KIND");
+  app.add_option("--app", request->applications,
+                 "Only records of applications that match this glob pattern; may be given several "
+                 "times")
+      ->type_name("GLOB")
+      ->expected(1)
+      ->take_all();
+  addTimes(app, request->since, request->until, "records");
+  addDatabase(app, request->database);
+  commands.onRun(
+      app, [request, kinds] { return checked(*request, *kinds); }, exportRecords);
+}
+
+}  // namespace halvox::tools
