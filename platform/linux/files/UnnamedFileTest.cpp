@@ -70,6 +70,32 @@ TEST_F(UnnamedFileTest, AFileThatRemainedIsReplaced) {
   EXPECT_EQ(::lseek(file_.get(), 0, SEEK_END), 0);
 }
 
+TEST_F(UnnamedFileTest, AFileThatAnotherProcessCreatesMeanwhileIsReplaced) {
+  static int calls;
+  calls = 0;
+  // After the first removal, another process creates its file.
+  const auto remove = [](const char* name) {
+    const int result = ::unlink(name);
+    if (calls++ == 0) std::ofstream(name) << "of another process";
+    return result;
+  };
+
+  ASSERT_EQ(createUnnamedFile(directory_, file_, remove), 0);
+
+  EXPECT_EQ(calls, 3);
+  EXPECT_EQ(names(), 0);
+  EXPECT_EQ(::lseek(file_.get(), 0, SEEK_END), 0);
+}
+
+TEST_F(UnnamedFileTest, ADirectoryThatHasTheNameDoesNotMatter) {
+  std::filesystem::create_directory(directory_ / ".halvox-overflow");
+
+  ASSERT_EQ(createUnnamedFile(directory_, file_), 0);
+
+  EXPECT_TRUE(file_);
+  EXPECT_EQ(names(), 1);
+}
+
 TEST_F(UnnamedFileTest, SaysWhyThereIsNoFile) {
   EXPECT_EQ(createUnnamedFile(directory_ / "missing", file_), ENOENT);
 
