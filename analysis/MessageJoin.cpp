@@ -1,5 +1,6 @@
 #include "analysis/MessageJoin.h"
 
+#include <algorithm>
 #include <bit>
 #include <cmath>
 #include <utility>
@@ -22,6 +23,17 @@ std::uint64_t keyOf(const Record& record) {
     key = (key ^ hash(text)) * 0x9E3779B97F4A7C15U;
   }
   return key | 1U;
+}
+
+// A message of a client may have this key, too, but has the service's stamp as a number. The stamps
+// of a summary are a text.
+bool isSummary(const Record& record) {
+  return record.kind == RecordKind::kLinkMessage && record.type == "Unknown" &&
+         record.payload->text(kSummaryKey).has_value() && keyOf(record) == 0;
+}
+
+std::string_view payloadToKeep(const Record& record) {
+  return isSummary(record) ? R"({"HV_Session_Summary_Event":""})" : record.payload->json();
 }
 
 bool isSame(std::string_view text, std::string_view other) {
@@ -83,8 +95,10 @@ bool MessageJoin::completesTwin(const Record& record) {
 }
 
 void MessageJoin::addLinkMessage(const Record& record) {
+  if (isSummary(record)) return addSummary(record);
   const std::uint64_t key = keyOf(record);
   Waiting* message = find(key, record);
+  if (message != nullptr && record.sessionID) moveSummariesTo(*message, *record.sessionID);
   if (message == nullptr) {
     message = &push(record, key);
     // Without a stamp no later record can find this message.
@@ -95,6 +109,35 @@ void MessageJoin::addLinkMessage(const Record& record) {
   message->message.isLinkMessage = true;
   message->message.sessionID = record.sessionID;
   if (message->message.service.empty()) message->message.service = record.service;
+}
+
+void MessageJoin::addSummary(const Record& record) {
+  Waiting& summary = push(record, 0);
+  summary.isComplete = true;
+  summary.message.isLinkMessage = true;
+  summary.message.sessionID = record.sessionID;
+  summary.message.service = record.service;
+  if (record.sessionID) {
+    summaries_.emplace(*record.sessionID, firstNumber_ + waiting_.size() - 1);
+  }
+}
+
+// All of these summaries are behind the message, because it waited when they were added.
+void MessageJoin::moveSummariesTo(Waiting& message, std::int64_t sessionID) {
+  const auto [begin, end] = summaries_.equal_range(sessionID);
+  std::vector<std::uint64_t> numbers;
+  for (auto place = begin; place != end; ++place) numbers.push_back(place->second);
+  summaries_.erase(begin, end);
+  std::ranges::sort(numbers);
+  for (const std::uint64_t number : numbers) {
+    Waiting* const summary = waiting(number);
+    if (summary == nullptr) continue;
+    waitingBytes_ -= summary->message.payload.size();
+    summary->message.time = std::min(summary->message.time, message.message.time);
+    message.summaries.push_back(std::move(summary->message));
+    summary->message = {};
+    summary->isDelivered = true;
+  }
 }
 
 MessageJoin::Waiting* MessageJoin::find(std::uint64_t key, const Record& record) {
@@ -123,7 +166,7 @@ MessageJoin::Waiting* MessageJoin::find(std::uint64_t key, const Record& record)
 }
 
 MessageJoin::Waiting& MessageJoin::push(const Record& record, std::uint64_t key) {
-  const std::size_t bytes = record.payload->json().size();
+  const std::size_t bytes = payloadToKeep(record).size();
   while (!waiting_.empty() &&
          (waiting_.size() == kMostWaiting || waitingBytes_ + bytes > kMostWaitingBytes)) {
     deliverFirst();
@@ -143,7 +186,7 @@ MessageJoin::Waiting& MessageJoin::push(const Record& record, std::uint64_t key)
 
 void MessageJoin::setPayload(Message& message, const Record& record) {
   waitingBytes_ -= message.payload.size();
-  message.payload = record.payload->json();
+  message.payload = payloadToKeep(record);
   waitingBytes_ += message.payload.size();
 }
 
@@ -173,7 +216,16 @@ void MessageJoin::deliverFirst() {
     byKey_.erase(place);
     break;
   }
-  callback_(first.message);
+  if (first.key == 0 && first.message.sessionID) forgetSummary(*first.message.sessionID, number);
+  for (const Message& summary : first.summaries) callback_(summary);
+  if (!first.isDelivered) callback_(first.message);
+}
+
+void MessageJoin::forgetSummary(std::int64_t sessionID, std::uint64_t number) {
+  const auto [begin, end] = summaries_.equal_range(sessionID);
+  const auto place =
+      std::find_if(begin, end, [=](const auto& one) { return one.second == number; });
+  if (place != end) summaries_.erase(place);
 }
 
 void MessageJoin::finish() {

@@ -8,10 +8,14 @@
 #include <string>
 #include <string_view>
 #include <unordered_map>
+#include <vector>
 
 #include "analysis/RecordSource.h"
 
 namespace halvox::analysis {
+
+// The key that only the summary of a session's run has.
+inline constexpr std::string_view kSummaryKey = "HV_Session_Summary_Event";
 
 // One message of a client, or of the service itself, with all that its records say.
 struct Message {
@@ -36,7 +40,12 @@ struct Message {
 // one before, or any message of a service without a link in the store. A message therefore waits
 // for its other record until kLongestWait seconds of records, kMostWaiting messages, or
 // kMostWaitingBytes of payloads have passed. A payload that is larger waits alone. Messages come
-// out in the order of their first records. Belongs to one thread.
+// out in the order of their first records, with one exception: the summary that ends a run of a
+// session may be recorded after events of the session's next run, but not after their link
+// messages. It comes out before the first message whose link message is recorded after it. Of a
+// summary, which can have many megabytes, only the entry that names it is kept.
+//
+// Belongs to one thread.
 class MessageJoin {
  public:
   static constexpr double kLongestWait = 10;
@@ -55,13 +64,19 @@ class MessageJoin {
  private:
   struct Waiting {
     Message message;
-    std::uint64_t key = 0;    // of stamp, category and type; 0 without a stamp
-    bool hasCommon = false;   // its event under the name that all services share
-    bool isComplete = false;  // nothing more can come
+    std::uint64_t key = 0;             // of stamp, category and type; 0 without a stamp
+    bool hasCommon = false;            // its event under the name that all services share
+    bool isComplete = false;           // nothing more can come
+    std::vector<Message> summaries{};  // of earlier runs; delivered before this message
+    bool isDelivered = false;          // a summary that was delivered before another message
   };
 
   void addEvent(const Record& record);
   void addLinkMessage(const Record& record);
+  void addSummary(const Record& record);
+  // Moves the summaries of the session that wait behind that message to it.
+  void moveSummariesTo(Waiting& message, std::int64_t sessionID);
+  void forgetSummary(std::int64_t sessionID, std::uint64_t number);
   [[nodiscard]] bool completesTwin(const Record& record);
   // Finds a message that waits for a record of the other kind.
   [[nodiscard]] Waiting* find(std::uint64_t key, const Record& record);
@@ -77,6 +92,8 @@ class MessageJoin {
   std::uint64_t firstNumber_ = 0;                                // of waiting_.front()
   std::unordered_multimap<std::uint64_t, std::uint64_t> byKey_;  // key to number
   std::optional<std::uint64_t> lastEvent_;  // the number of the last event's message
+  std::unordered_multimap<std::int64_t, std::uint64_t>
+      summaries_;  // session to number, if it waits
 };
 
 }  // namespace halvox::analysis

@@ -42,6 +42,42 @@ TEST_F(MessageJoinTest, AMessageThatOnlyTheLinkRecordedHasTheIDOfThatRecord) {
   EXPECT_THAT(delivered, ElementsAre(1));
 }
 
+TEST_F(MessageJoinTest, ASummaryComesBeforeTheMessagesOfTheNextRunEvenIfItWasRecordedLater) {
+  records.message({}, "Session_Playback", "Stop");             // 1 to 3
+  records.event({}, "Session_Playback", "Start");              // 4 and 5, of the next run
+  records.event({.sessionID = 8}, "Session_Record", "Start");  // 6 and 7
+  records.summary({});                                         // 8
+  records.link({.sessionID = 8}, "Session_Record", "Start");   // 9
+  records.link({}, "Session_Playback", "Start");               // 10
+  records.message({}, "Session_Playback", "State");            // 11 to 13
+  addAll();
+  join.finish();
+
+  EXPECT_THAT(delivered, ElementsAre(1, 8, 4, 6, 11));
+}
+
+TEST_F(MessageJoinTest, SummariesOfSeveralRunsKeepTheirOrder) {
+  records.event({}, "Session_Playback", "Start");
+  records.summary({});
+  records.summary({});
+  records.link({}, "Session_Playback", "Start");
+  records.summary({});
+  addAll();
+  join.finish();
+
+  EXPECT_THAT(delivered, ElementsAre(3, 4, 1, 6));
+}
+
+TEST_F(MessageJoinTest, ALongSummaryDoesNotDisplaceTheMessagesThatWait) {
+  records.event({}, "Session_Playback", "Start");
+  records.summary({}, std::string(MessageJoin::kMostWaitingBytes + 1, '1'));
+  addAll();
+  EXPECT_THAT(delivered, IsEmpty());
+  join.finish();
+
+  EXPECT_THAT(delivered, ElementsAre(1, 3));
+}
+
 TEST_F(MessageJoinTest, TheBytesOfWaitingMessagesAreBounded) {
   const std::string text(1U << 20U, 'x');
   constexpr std::size_t kMessages = 20;

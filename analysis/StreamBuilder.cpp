@@ -13,7 +13,6 @@ namespace {
 using ServiceTimes = StreamBuilder::ServiceTimes;
 
 constexpr std::string_view kClientGoneEvent = "com.tarno.halvox.hvreportingclientuptime";
-constexpr std::string_view kSummaryKey = "HV_Session_Summary_Event";
 constexpr std::string_view kSerialKey = "object_serial";
 // The kernel keeps the first 15 bytes of a program's name.
 constexpr std::string_view kReporterProcess = "halvox-pipewire";

@@ -277,6 +277,21 @@ TEST_F(StreamBuilderTest, ASessionThatIsStartedAgainIsAnotherStory) {
   EXPECT_THAT(stories, SizeIs(2));
 }
 
+TEST_F(StreamBuilderTest, ASummaryThatIsRecordedDuringTheNextRunEndsTheRunBeforeIt) {
+  start(0, session());
+  stop(1, session());
+  at(2).event(session(), "Session_Playback", "Start", "\"run\":2");
+  records.summary(session());
+  records.link(session(), "Session_Playback", "Start", "\"run\":2");
+  stop(5, session(), 2);
+  records.summary(session());
+
+  build();
+  ASSERT_THAT(stories, SizeIs(2));
+  EXPECT_DOUBLE_EQ(stories[0].ranSeconds, 1);
+  EXPECT_DOUBLE_EQ(stories[1].ranSeconds, 3);
+}
+
 TEST_F(StreamBuilderTest, AClientThatDisconnectsWhileItRunsIsGone) {
   start(0, stream());
   volume(0, stream(), 0.5, true);

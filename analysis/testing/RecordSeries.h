@@ -62,8 +62,10 @@ class RecordSeries final : public RecordSource {
     stored.sessionID = sender.sessionID.value_or(-1);
   }
   // Adds the summary that a stop sends through the link.
-  void summary(const Sender& sender) {
-    Stored& stored = add(RecordKind::kLinkMessage, R"({"HV_Session_Summary_Event":"7"})");
+  void summary(const Sender& sender, const std::string& stamps = "1,2") {
+    Stored& stored =
+        add(RecordKind::kLinkMessage,
+            R"({"HV_Session_Summary_Event":"7","hvreporting_timestamp":")" + stamps + "\"}");
     stored.service = sender.service;
     stored.category = "Undefined";
     stored.type = "Unknown";
