@@ -15,9 +15,11 @@ namespace {
 
 // How long the end of the service waits for running jobs to end.
 constexpr std::chrono::seconds kJobsEndWithin{5};
-// Before that, the end of the service waits this long for the queues of sessions to run their
-// pending jobs.
-constexpr std::chrono::seconds kQueuesFinishWithin{5};
+// Before that, the end of the service waits for the queues of sessions to run their pending jobs.
+// The summary of a session of a million messages takes about a second. Several of them are made one
+// after the other. systemd kills a service that takes longer than 90 seconds to end.
+constexpr AsioDispatchService::FinishLimits kQueuesFinish{
+    .withoutProgress = std::chrono::seconds(5), .total = std::chrono::seconds(30)};
 
 const char* linkName(LinkBackend backend) {
   switch (backend) {
@@ -120,7 +122,10 @@ bool LinuxPlatform::close() {
   adapters_->traces->stop();
   // A message that was answered without an error must reach the link. The queue of its session may
   // still hold it, because these queues have a lower priority than requests.
-  adapters_->dispatch.finish(kQueuesFinishWithin);
+  if (const std::uint64_t jobs = adapters_->dispatch.finish(kQueuesFinish); jobs > 0) {
+    log_.error("the queues of sessions have not finished in time; discarding ", jobs,
+               " jobs: their messages and summaries do not reach the link");
+  }
   const bool ended = adapters_->dispatch.stop(kJobsEndWithin);
   ended ? adapters_->traces->close() : adapters_->traces->abandon();
   // Stop the callbacks after the queues, when no session can request a callback any more.

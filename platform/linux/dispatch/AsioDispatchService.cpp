@@ -48,9 +48,19 @@ void AsioDispatchService::holdPool() { DispatchThread::current().holdPool(); }
 
 void AsioDispatchService::wakePool() { DispatchThread::current().wakePool(); }
 
-void AsioDispatchService::finish(std::chrono::milliseconds limit) {
+std::uint64_t AsioDispatchService::finish(const FinishLimits& limits) {
   wakePool();  // starts the turns that this thread still holds back
-  pool_->waitUntilIdle(std::chrono::steady_clock::now() + limit);
+  const auto end = std::chrono::steady_clock::now() + limits.total;
+  QueueLabels::Jobs before = pool_->labels().jobs();
+  while (true) {
+    const auto now = std::chrono::steady_clock::now();
+    if (pool_->waitUntilIdle(std::min(now + limits.withoutProgress, end))) return 0;
+    const QueueLabels::Jobs jobs = pool_->labels().jobs();
+    if (jobs.run == before.run || std::chrono::steady_clock::now() >= end) {
+      return jobs.added - jobs.run;
+    }
+    before = jobs;
+  }
 }
 
 bool AsioDispatchService::stop(std::chrono::milliseconds limit) {

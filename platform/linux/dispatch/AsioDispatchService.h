@@ -65,10 +65,15 @@ class AsioDispatchService final : public DispatchService {
   void holdPool();
   void wakePool();
 
-  // Waits until the shared queues have run their jobs, at most for `limit`. An orderly end calls
-  // this to lose nothing. Does not wait for queues that wait on semaphores, nor for delayed jobs
-  // that are not due. Must not be called from a job.
-  void finish(std::chrono::milliseconds limit);
+  // How long finish() waits at most: while no job ends, and in total.
+  struct FinishLimits {
+    std::chrono::milliseconds withoutProgress;
+    std::chrono::milliseconds total;
+  };
+  // Waits until the shared queues have run their jobs. An orderly end calls this to lose nothing.
+  // Does not wait for queues that wait on semaphores, nor for delayed jobs that are not due.
+  // Returns 0, or the number of jobs that had not run at the limit. Must not be called from a job.
+  [[nodiscard]] std::uint64_t finish(const FinishLimits& limits);
   // Ends each thread after the job that it runs. Discards and counts all other jobs, and those that
   // are added later. Waits at most for `limit`. If a job still runs then, logs the labels of the
   // stuck queues and returns false; the process should then end without destroying this object. May

@@ -6,6 +6,7 @@
 #include <csignal>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <future>
 #include <memory>
 #include <optional>
@@ -228,6 +229,53 @@ TEST_F(AsioDispatchServiceTest, QueuesMayOutliveTheService) {
   own->async(JobWeight::kBrief, [] { FAIL(); });
   shared->async(JobWeight::kBrief, [] { FAIL(); });
   EXPECT_EQ(count("jobs discarded at the stop"), 2U);
+}
+
+TEST_F(AsioDispatchServiceTest, FinishWaitsAsLongAsJobsEnd) {
+  constexpr int kJobs = 8;
+  const auto queue = createQueue(QueueThreading::kShared);
+  std::promise<void> never;
+  const std::shared_future<void> longJob = never.get_future().share();
+  std::atomic<int> ran{0};
+  for (int job = 0; job < kJobs; ++job) {
+    queue->async(JobWeight::kMayBlock, [&ran, longJob] {
+      longJob.wait_for(std::chrono::milliseconds(100));
+      ++ran;
+    });
+  }
+
+  // All jobs together take longer than the limit for one of them.
+  EXPECT_EQ(
+      service_->finish({.withoutProgress = std::chrono::milliseconds(500), .total = kTestDeadline}),
+      0U);
+
+  EXPECT_EQ(ran, kJobs);
+}
+
+TEST_F(AsioDispatchServiceTest, FinishEndsWithoutProgressAndSaysWhatIsLeft) {
+  StuckQueue stuck(*service_, "stuck", QueueThreading::kShared);
+  const auto queue =
+      service_->createSerialQueue("q", QualityOfService::kUtility, QueueThreading::kShared);
+  queue->async(JobWeight::kBrief, [] {});
+  ASSERT_TRUE(drain(*queue));
+
+  EXPECT_EQ(
+      service_->finish({.withoutProgress = std::chrono::milliseconds(20), .total = kTestDeadline}),
+      1U);
+
+  stuck.release();
+}
+
+TEST_F(AsioDispatchServiceTest, FinishIsBoundedEvenIfJobsEndForEver) {
+  const auto queue = createQueue(QueueThreading::kShared);
+  std::function<void()> again = [&] { queue->async(JobWeight::kBrief, again); };
+  again();
+
+  EXPECT_GE(service_->finish({.withoutProgress = std::chrono::milliseconds(20),
+                              .total = std::chrono::milliseconds(60)}),
+            1U);
+
+  EXPECT_TRUE(service_->stop(kTestDeadline));
 }
 
 class AsioDispatchWaitTest : public AsioDispatchServiceTest {

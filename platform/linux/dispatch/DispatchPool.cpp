@@ -36,12 +36,13 @@ asio::io_context& DispatchPool::context(QualityOfService quality) {
   return utility_.context();
 }
 
-void DispatchPool::waitUntilIdle(std::chrono::steady_clock::time_point deadline) {
+bool DispatchPool::waitUntilIdle(std::chrono::steady_clock::time_point deadline) {
   // Set this before reading turns_. From here on, the last turn that ends calls reportIdle().
   isAwaited_.store(true);
   const MutexLock lock(mutex_);
   while (turns_.load() > 0 && idle_.waitUntil(mutex_, deadline)) {
   }
+  return turns_.load() <= 0;
 }
 
 void DispatchPool::reportIdle() {

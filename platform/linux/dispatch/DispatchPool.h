@@ -52,8 +52,9 @@ class DispatchPool {
     if (turns_.fetch_sub(1) == 1 && isAwaited_.load()) reportIdle();
   }
   // Waits until no queue has a job that can run now, at most until `deadline`. Does not wait for
-  // queues that wait on semaphores, nor for delayed jobs that are not due.
-  void waitUntilIdle(std::chrono::steady_clock::time_point deadline);
+  // queues that wait on semaphores, nor for delayed jobs that are not due. Returns false at the
+  // deadline.
+  bool waitUntilIdle(std::chrono::steady_clock::time_point deadline);
 
   // Lets each thread end after the job that it runs. From now on, no wait on a semaphore ends.
   void stop();

@@ -127,7 +127,7 @@ TEST_F(EnteringTest, TheEndWaitsForAnEntry) {
   {
     const QueueEntry entry(*queue_);
     ending = std::jthread([&] {
-      service_->finish(kTestDeadline);
+      EXPECT_EQ(service_->finish({.withoutProgress = kTestDeadline, .total = kTestDeadline}), 0U);
       hasEnded = true;
     });
     EXPECT_TRUE(staysQuiet([&hasEnded] { return long{hasEnded}; }, kQuietTime));

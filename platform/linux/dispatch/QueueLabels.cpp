@@ -16,6 +16,17 @@ QueueLabel& QueueLabels::label(std::string_view text) {
   return place->second;
 }
 
+QueueLabels::Jobs QueueLabels::jobs() {
+  const MutexLock lock(mutex_);
+  Jobs jobs;
+  for (const auto& [text, label] : labels_) {
+    // Read in this order, because a job is counted as added before it is counted as run.
+    jobs.run += label.run.value();
+    jobs.added += label.added.value();
+  }
+  return jobs;
+}
+
 std::vector<std::string> QueueLabels::atWork() {
   const MutexLock lock(mutex_);
   std::vector<std::string> texts;

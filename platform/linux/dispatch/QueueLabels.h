@@ -1,6 +1,7 @@
 #pragma once
 
 #include <atomic>
+#include <cstdint>
 #include <map>
 #include <string>
 #include <string_view>
@@ -34,6 +35,12 @@ class QueueLabels {
   // Returns the label with that text, and makes it at the first call. The label is valid as long as
   // this object exists.
   QueueLabel& label(std::string_view text) HALVOX_EXCLUDES(mutex_);
+  // The numbers of jobs of all labels together.
+  struct Jobs {
+    std::uint64_t added = 0;
+    std::uint64_t run = 0;
+  };
+  [[nodiscard]] Jobs jobs() HALVOX_EXCLUDES(mutex_);
   // Returns the texts of the labels that have a queue with a turn.
   [[nodiscard]] std::vector<std::string> atWork() HALVOX_EXCLUDES(mutex_);
 
