@@ -8,6 +8,7 @@
 #include <utility>
 #include <variant>
 
+#include "platform/linux/runtime/Version.h"
 #include "platform/linux/store/reading/StoreExport.h"
 #include "platform/value.h"
 #include "tools/Complaint.h"
@@ -18,6 +19,7 @@
 #include "tools/export/ExportOutput.h"
 #include "tools/export/ExportProgress.h"
 #include "tools/export/JsonlWriter.h"
+#include "tools/export/OtlpWriter.h"
 
 namespace halvox::tools {
 namespace {
@@ -71,7 +73,7 @@ class Export {
 
   std::optional<ExportFailure> toText() {
     const auto output = makeOutput();
-    const auto writer = request_.format == ExportFormat::kCsv ? makeCsvWriter() : makeJsonlWriter();
+    const auto writer = makeWriter();
     std::string text;
     const auto write = [&](std::size_t atLeast) -> Result<void> {
       if (text.size() < atLeast) return {};
@@ -108,6 +110,13 @@ class Export {
     if (!handled) return cannotWrite(handled);
     if (!read) return ExportFailure{ExitStatus::kNoService, read.error().message};
     return std::nullopt;
+  }
+
+  [[nodiscard]] std::unique_ptr<RecordWriter> makeWriter() const {
+    if (request_.format == ExportFormat::kCsv) return makeCsvWriter();
+    return request_.format == ExportFormat::kJsonl
+               ? makeJsonlWriter()
+               : makeOtlpWriter(platform::linux_::halvoxVersion());
   }
 
   [[nodiscard]] std::unique_ptr<ExportOutput> makeOutput() const {

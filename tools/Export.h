@@ -11,7 +11,7 @@
 
 namespace halvox::tools {
 
-enum class ExportFormat : std::uint8_t { kSqlite, kJsonl, kCsv };
+enum class ExportFormat : std::uint8_t { kSqlite, kJsonl, kCsv, kOtlpJson };
 
 struct ExportRecords {
   ExportFormat format = ExportFormat::kSqlite;

@@ -1,5 +1,6 @@
 """halvoxctl export: what other programs read is what the store has."""
 
+import base64
 import csv
 import io
 import json
@@ -38,6 +39,20 @@ APPLICATIONS = {7: "org.example.player", 8: FORMULA}
 def exact(text):
     """Parses JSON and keeps numbers as they are written."""
     return json.loads(text, parse_int=str, parse_float=str)
+
+
+def plain(value):
+    """The JSON value of an AnyValue of OpenTelemetry."""
+    if not value:
+        return None
+    [(kind, content)] = value.items()
+    if kind == "kvlistValue":
+        return {member["key"]: plain(member["value"]) for member in content["values"]}
+    return [plain(item) for item in content["values"]] if kind == "arrayValue" else content
+
+
+def attributes(of):
+    return {one["key"]: plain(one["value"]) for one in of["attributes"]}
 
 
 class ExportTestCase(unittest.TestCase):
@@ -192,6 +207,39 @@ class ExportTest(ExportTestCase):
         table = self.export("--format", "csv", *selection).stdout.decode()
         self.assertEqual(table.count("\r\n"), count + 1)
 
+    def test_requests_of_opentelemetry_have_every_record(self):
+        requests = [exact(line) for line in self.split(self.export("--format", "otlp-json").stdout)]
+        records = []
+        for request in requests:
+            self.assertEqual(list(request), ["resourceLogs"])
+            [of_resource] = request["resourceLogs"]
+            self.assertEqual(attributes(of_resource["resource"]),
+                             {"service.name": "halvox-reportingd"})
+            [of_scope] = of_resource["scopeLogs"]
+            self.assertEqual(of_scope["scope"]["name"], "halvoxctl")
+            records += of_scope["logRecords"]
+        lines = [exact(line) for line in self.lines()]
+        self.assertEqual(len(records), len(lines))
+        for record, line in zip(records, lines):
+            known = attributes(record)
+            self.assertEqual((known["halvox.kind"], known["halvox.record.id"]),
+                             (line["kind"], line["id"]))
+            self.assertIsInstance(record["observedTimeUnixNano"], str)
+            self.assertAlmostEqual(int(record["observedTimeUnixNano"]) / 1e9, float(line["time"]),
+                                   places=5)
+            if "payload" in line:
+                self.assertEqual(plain(record["body"]), line["payload"])
+                stamp = line["payload"].get("hvreporting_timestamp", line["time"])
+                if "," not in stamp:  # the summary of a session has all stamps as a text
+                    self.assertAlmostEqual(int(record["timeUnixNano"]) / 1e9, float(stamp), places=5)
+            if line["kind"] == "events":
+                self.assertEqual(record["eventName"], line["name"])
+                self.assertEqual(record["severityText"] == "WARN", "IssueDetector" in line["name"])
+            if line["kind"] == "link":
+                self.assertEqual(known["halvox.session.id"], line["session_id"])
+            if line["kind"] == "metrics":
+                self.assertEqual(base64.b64decode(record["body"]["bytesValue"]).hex(), line["message"])
+
     def test_a_file_appears_when_it_is_complete_and_is_not_overwritten(self):
         file = self.directory / "records.jsonl"
         self.export("--format", "jsonl", "-o", file)
@@ -287,7 +335,7 @@ class LargeStoreTest(ExportTestCase):
         self.assertEqual(process.wait(DEADLINE), 0)
         return most, total
 
-    FORMATS = ("jsonl", "csv")
+    FORMATS = ("jsonl", "csv", "otlp-json")
 
     @unittest.skipIf(os.environ.get("HALVOX_SANITIZE"), "sanitizers keep freed memory")
     def test_memory_does_not_grow_with_the_store(self):

@@ -17,10 +17,11 @@ using platform::linux_::Result;
 
 constexpr const char* kStandardOutput = "-";
 
-constexpr std::array<std::pair<std::string_view, ExportFormat>, 3> kFormats{
+constexpr std::array<std::pair<std::string_view, ExportFormat>, 4> kFormats{
     {{"sqlite", ExportFormat::kSqlite},
      {"jsonl", ExportFormat::kJsonl},
-     {"csv", ExportFormat::kCsv}}};
+     {"csv", ExportFormat::kCsv},
+     {"otlp-json", ExportFormat::kOtlpJson}}};
 constexpr std::array kKinds{ExportKind::kEvents, ExportKind::kMetrics, ExportKind::kPower,
                             ExportKind::kLink, ExportKind::kSnapshots};
 
@@ -79,7 +80,8 @@ void addExportCommand(CommandSet& commands) {
        .reach = CommandReach::kFiles});
   addParsed(app, "--format", request->format, parseFormat,
             "sqlite: a database with five plain tables (default); jsonl: one JSON object a line; "
-            "csv: one table for spreadsheets")
+            "csv: one table for spreadsheets; otlp-json: log records of OpenTelemetry, one request "
+            "a line")
       ->type_name("FORMAT");
   app.add_option("-o,--output,--to", request->to,
                  "The file to write; - is the standard output (default, except for sqlite)")
