@@ -38,6 +38,7 @@ constexpr CommandGroup kGroups[] = {
     {"What the service stored", addSnapshotCommands, GroupPlace::kArguments},
     {"What the service stored", addSummaryCommand, GroupPlace::kArguments},
     {"What the service stored", addReportCommand, GroupPlace::kArguments},
+    {"What the service stored", addFieldCommand, GroupPlace::kArguments},
     {"What the service stored", addQueryCommands, GroupPlace::kArguments},
     {"What the service stored", addExportCommand, GroupPlace::kArguments},
     {"Traces and drivers", addTraceCommands, GroupPlace::kArguments},

@@ -12,6 +12,7 @@
 #include "tools/Drivers.h"
 #include "tools/Events.h"
 #include "tools/Export.h"
+#include "tools/Fields.h"
 #include "tools/Notify.h"
 #include "tools/Preferences.h"
 #include "tools/Records.h"
@@ -348,6 +349,19 @@ TEST(CommandLineTest, SqlTakesAQueryOrReadsTheInput) {
   EXPECT_EQ(asked({"sql", "SELECT 1", "--database", "/d"}).query, "SELECT 1");
   EXPECT_EQ(asked({"sql", "SELECT 1", "--database", "/d"}).database, "/d");
   EXPECT_EQ(asked({"sql"}).query, "");
+}
+
+TEST(CommandLineTest, FieldsAreChosenByApplicationCategoryTypeAndTime) {
+  const auto fields =
+      runOf<ShowFields>({"fields", "--app", "a*", "--category", "Session_Playback", "--type",
+                         "Start", "--since", "@5", "--until", "@9.5", "--database", "/d"});
+
+  EXPECT_EQ(fields.applications, std::vector<std::string>{"a*"});
+  EXPECT_EQ(fields.categories, std::vector<std::uint32_t>{0x08000004});
+  EXPECT_EQ(fields.types, std::vector<std::uint16_t>{1});
+  EXPECT_EQ(fields.since, 5.0);
+  EXPECT_EQ(fields.until, 9.5);
+  EXPECT_EQ(fields.database, "/d");
 }
 
 TEST(CommandLineTest, ExportTakesAFileAndTimes) {

@@ -1,0 +1,97 @@
+"""The keys of stored records."""
+
+import contextlib
+import fcntl
+import json
+import os
+import pty
+import struct
+import subprocess
+import termios
+import unittest
+
+from harness import CTL, DEADLINE, Service, wait_for
+
+VOLUME, STATE = 14, 18
+SESSION_PLAYBACK, JOULEBOOK = 0x08000004, 8
+HAPTICS, LONG_FORM = 3, 7
+
+
+class FieldsTest(unittest.TestCase):
+    def setUp(self):
+        self.service = Service()
+        self.service.__enter__()
+        self.addCleanup(self.service.__exit__)
+        self.client = self.service.client()
+        self.addCleanup(self.client.close)
+        for session, service_type in ((7, LONG_FORM), (8, HAPTICS)):
+            self.client.create(session)
+            self.client.set_type(service_type, session)
+            self.client.configure({"HostApplicationDisplayID": f"org.app{session}"}, session)
+            self.client.start_later(session)
+        self.client.send({"gain": 0.5, "list": [1, 2]}, VOLUME, STATE, [7])
+        self.client.send({"gain": "high"}, SESSION_PLAYBACK, 1, [8])
+        self.client.send({"EngineOnTime": 4.5}, SESSION_PLAYBACK, JOULEBOOK, [8])
+        wait_for("the messages", lambda: self.service.database.exists()
+                 and len(self.service.link_messages(8)) == 2 and len(self.service.link_messages(7)) == 1)
+        wait_for("the events", lambda: len(self.service.events()) == 6)
+        wait_for("the power event", lambda: "EngineOnDuration" in self.fields())
+
+    def ctl(self, *arguments, status=0):
+        result = subprocess.run(
+            [CTL, *arguments], capture_output=True, text=True, check=False, timeout=DEADLINE,
+            env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
+        self.assertEqual(result.returncode, status, result.stderr)
+        return result
+
+    def fields(self, *arguments):
+        lines = self.ctl("fields", "--json", *arguments).stdout.splitlines()
+        return {field["key"]: field for field in map(json.loads, lines)}
+
+    def test_every_key_is_listed_with_types_counts_and_places(self):
+        fields = self.fields()
+
+        gain = fields["gain"]
+        self.assertEqual(gain["types"], {"number": 2, "text": 2})
+        self.assertEqual((gain["events"], gain["link_messages"], gain["records"]), (2, 2, 4))
+        self.assertEqual({place["name"]: place["count"] for place in gain["in"]},
+                         {"Volume.State": 2, "Session_Playback.Start": 2})
+        self.assertEqual(fields["list"]["example"], [1, 2])
+        self.assertEqual(fields["EngineOnDuration"]["power_events"], 1)
+        self.assertEqual(fields["EngineOnDuration"]["in"], [{"name": "Oxbow_Haptics", "count": 1}])
+        self.assertEqual(fields["audiotag"]["events"], 0)
+        self.assertEqual(fields["hvreporting_timestamp"]["events"], 3)
+        self.assertEqual(list(fields), sorted(fields))
+
+    def test_filters_select(self):
+        self.assertNotIn("list", self.fields("--category", "Session_Playback"))
+        self.assertIn("list", self.fields("--type", "State"))
+        self.assertEqual(self.fields("--app", "org.app8")["gain"]["example"], "high")
+        self.assertNotIn("audiotag", self.fields("--app", "*"))
+        self.assertEqual(self.fields("--until", "1h"), {})
+
+    def test_a_table_fits_the_terminal(self):
+        self.assertIn("Session_Playback.Start", self.ctl("fields").stdout)
+        for width in (40, 80, 120):
+            lines = self.at_terminal(width, "fields")
+            self.assertEqual(len(lines), len(self.fields()) + 1)
+            for line in lines:
+                self.assertLessEqual(len(line), width, line)
+
+    def at_terminal(self, width, *arguments):
+        ours, theirs = pty.openpty()
+        fcntl.ioctl(theirs, termios.TIOCSWINSZ, struct.pack("HHHH", 24, width, 0, 0))
+        process = subprocess.Popen([CTL, *arguments], stdin=subprocess.DEVNULL, stdout=theirs,
+                                   env={**os.environ, "HALVOX_CONFIG": str(self.service.config)})
+        os.close(theirs)
+        text = b""
+        with contextlib.suppress(OSError):  # the end of the other side
+            while piece := os.read(ours, 4096):
+                text += piece
+        os.close(ours)
+        self.assertEqual(process.wait(DEADLINE), 0)
+        return text.decode().splitlines()
+
+
+if __name__ == "__main__":
+    unittest.main()
