@@ -25,14 +25,24 @@ constexpr std::uint32_t kPowerLogCategory = 28;
 constexpr std::string_view kEngineEvent = "Oxbow_Haptics";
 constexpr std::string_view kLeakEvent = "LeakedHapticsSessionInfo";
 
-Dictionary enginePayload(const Dictionary& message, const Value& onTime,
-                         const HVReportingSession& session) {
+// The keys by which a message is recognised.
+const Key& engineOnTimeKey() {
+  static const Key key("EngineOnTime");
+  return key;
+}
+const Key& activeTimeKey() {
+  static const Key key("Haptic_Active_Hardware_Time_Seconds");
+  return key;
+}
+
+// The message must have the key of the report.
+Dictionary enginePayload(const Dictionary& message, const HVReportingSession& session) {
   static const Key duration("EngineOnDuration");
   static const Key application("ApplicationName");
   static const Key timestamp("hvreporting_timestamp");
   static const Key end("TimestampEnd");
   Dictionary payload;
-  payload.set(duration, onTime);
+  payload.set(duration, *message.find(engineOnTimeKey()));
   const Value appName = HVReportingUtilityRetrieveAppName(session.configuration());
   // Always true, because the name defaults to "Unknown". The test and its log line are nevertheless
   // required.
@@ -49,39 +59,39 @@ Dictionary enginePayload(const Dictionary& message, const Value& onTime,
   return payload;
 }
 
-Dictionary leakPayload(const Dictionary& message, const Key& key, const Value& activeTime) {
+Dictionary leakPayload(const Dictionary& message) {
   static const Key clients("Active_Clients");
   Dictionary payload;
-  payload.set(key, activeTime);
+  payload.set(activeTimeKey(), *message.find(activeTimeKey()));
   // Unlike a missing time stamp, a missing number of clients is not logged; this is required.
   if (const Value* active = message.find(clients)) payload.set(clients, *active);
   return payload;
 }
 
-void logEvent(std::string_view name, const Dictionary& payload) {
-  platform::powerLog().logPowerEvent(kPowerLogCategory, name, payload, std::nullopt);
-}
-
 }  // namespace
+
+std::optional<std::string_view> HVReportingJoulebookUtility::eventOf(
+    const platform::Message& message, AudioEventType type) {
+  if (type != AudioEventType::kJoulebook || !message.has_value()) return std::nullopt;
+  // A message with both keys is an engine report only; this is required.
+  if (message->find(engineOnTimeKey()) != nullptr) return kEngineEvent;
+  if (message->find(activeTimeKey()) != nullptr) return kLeakEvent;
+  return std::nullopt;
+}
 
 void HVReportingJoulebookUtility::handleEvent(const platform::Message& message,
                                               AudioEventCategory /*category*/, AudioEventType type,
                                               const std::shared_ptr<HVReportingSession>& session,
                                               const PowerLogCounters& counters) {
   if (type != AudioEventType::kJoulebook || !message.has_value()) return;
-  static const Key engineOnTime("EngineOnTime");
-  static const Key activeTime("Haptic_Active_Hardware_Time_Seconds");
   counters.received.add();
-  // A message with both keys is an engine report only; this is required.
-  if (const Value* onTime = message->find(engineOnTime)) {
-    logEvent(kEngineEvent, enginePayload(*message, *onTime, *session));
-    counters.delivered.add();
-  } else if (const Value* leaked = message->find(activeTime)) {
-    logEvent(kLeakEvent, leakPayload(*message, activeTime, *leaked));
-    counters.delivered.add();
-  } else {
-    counters.unknown.add();
-  }
+  const auto event = eventOf(message, type);
+  if (!event) return counters.unknown.add();
+  platform::powerLog().logPowerEvent(
+      kPowerLogCategory, *event,
+      *event == kEngineEvent ? enginePayload(*message, *session) : leakPayload(*message),
+      std::nullopt);
+  counters.delivered.add();
 }
 
 }  // namespace halvox

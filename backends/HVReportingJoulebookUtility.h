@@ -1,6 +1,8 @@
 #pragma once
 
 #include <memory>
+#include <optional>
+#include <string_view>
 
 #include "backends/HVReportingVocabulary.h"
 #include "platform/value.h"
@@ -16,6 +18,10 @@ struct PowerLogCounters;
 class HVReportingJoulebookUtility {
  public:
   HVReportingJoulebookUtility() = delete;
+
+  // Returns the name of the power event that a message makes; std::nullopt if it makes none.
+  static std::optional<std::string_view> eventOf(const platform::Message& message,
+                                                 AudioEventType type);
 
   // Logs at most one power event for a message of type kJoulebook. If a message reports both, the
   // engine takes precedence. Ignores messages of other types and a missing message. Does not use

@@ -155,6 +155,20 @@ TEST_F(HVReportingJoulebookUtilityTest, ReportsAreCountedAndTheCountsBalance) {
   EXPECT_EQ(platform_.statistics.value("power log bridge", "dropped: no known report"), 1U);
 }
 
+TEST_F(HVReportingJoulebookUtilityTest, TheEventOfAMessageIsKnownWithoutLoggingIt) {
+  const auto eventOf = HVReportingJoulebookUtility::eventOf;
+  const Dictionary both{{"Haptic_Active_Hardware_Time_Seconds", 4}, {"EngineOnTime", 4}};
+
+  EXPECT_EQ(eventOf(both, AudioEventType::kJoulebook), "Oxbow_Haptics");
+  EXPECT_EQ(
+      eventOf(Dictionary{{"Haptic_Active_Hardware_Time_Seconds", 4}}, AudioEventType::kJoulebook),
+      "LeakedHapticsSessionInfo");
+  EXPECT_EQ(eventOf(Dictionary{}, AudioEventType::kJoulebook), std::nullopt);
+  EXPECT_EQ(eventOf(std::nullopt, AudioEventType::kJoulebook), std::nullopt);
+  EXPECT_EQ(eventOf(both, AudioEventType::kStart), std::nullopt);
+  EXPECT_THAT(platform_.powerLog.events(), IsEmpty());
+}
+
 TEST_F(HVReportingJoulebookUtilityTest, NoBridgeObjectCanBeMade) {
   EXPECT_FALSE(std::is_default_constructible_v<HVReportingJoulebookUtility>);
 }

@@ -1,11 +1,9 @@
 #include "backends/HVReportingTallyhubBridge.h"
 
-#include <array>
-#include <initializer_list>
-#include <string>
 #include <string_view>
 #include <utility>
 
+#include "backends/HVReportingEventNames.h"
 #include "backends/HVReportingUtility.h"
 #include "platform/analytics.h"
 #include "platform/services.h"
@@ -19,24 +17,6 @@ using platform::Key;
 using platform::Message;
 
 namespace {
-
-// Joins the parts of an event name without an allocation, because every message makes two names and
-// most of them are only tested, never sent.
-class EventName {
- public:
-  EventName(std::initializer_list<std::string_view> parts) {
-    for (const std::string_view part : parts) {
-      length_ += part.copy(text_.data() + length_, text_.size() - length_);
-    }
-  }
-  [[nodiscard]] std::string_view text() const { return {text_.data(), length_}; }
-
- private:
-  // The longest name, with PlaybackAndRecord and HeadphoneAudioExposure, has 75 characters. A name
-  // that does not fit would be cut: check this size when a text is added to the vocabulary.
-  std::array<char, 128> text_;
-  std::size_t length_ = 0;
-};
 
 // `message` shares its entries with the messages of the other bridges and of the session until it
 // is changed here.
@@ -69,18 +49,11 @@ void sendIfUsed(std::string_view name, const Message& message,
 void HVReportingTallyhubBridge::handleEvent(const Message& message, AudioEventCategory category,
                                             AudioEventType type,
                                             const std::shared_ptr<HVReportingSession>& session) {
-  const HVReportingCategoryText categoryText = HVReportingUtilityCategoryTextParts(category);
-  const std::string_view typeText = HVReportingUtilityTypeString(type);
-  const std::string_view serviceName =
-      HVReportingUtilityGenerateServiceNameFromServiceType(session->serviceType());
-
-  const EventName ofAll{"com.tarno.halvox.", categoryText.domain, categoryText.name, ".", typeText};
-  const EventName ofService{"com.tarno.",      serviceName, ".",     categoryText.domain,
-                            categoryText.name, ".",         typeText};
+  const HVReportingEventNames names(category, type, session->serviceType());
   // This order is required. Send nothing between the two, because the store keeps consecutive
   // events with equal payloads as one record.
-  sendIfUsed(ofAll.text(), message, session);
-  sendIfUsed(ofService.text(), message, session);
+  sendIfUsed(names.ofAll.text(), message, session);
+  sendIfUsed(names.ofService.text(), message, session);
 }
 
 }  // namespace halvox

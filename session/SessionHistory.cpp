@@ -24,6 +24,12 @@ bool isExemptFromSuppression(AudioEventCategory category, AudioEventType type) {
 
 }  // namespace
 
+bool SessionHistory::isRedundant(const platform::Dictionary* previous, AudioEventCategory category,
+                                 AudioEventType type, const platform::Dictionary& message) {
+  return previous != nullptr && !isExemptFromSuppression(category, type) &&
+         equalApartFromVolatileKeys(*previous, message);
+}
+
 void SessionHistory::begin() {
   std::optional<MessageHistory> previous(std::in_place);  // destroyed without the lock
   auto volumes = std::make_unique<VolumeHistory>();
@@ -83,8 +89,7 @@ SessionHistory::Outcome SessionHistory::recordLocked(const Lock& history,
   // Both are required.
   const platform::Dictionary* previous = messages.newestMessage(base);
   Outcome outcome = Outcome::kRecorded;
-  if (previous != nullptr && !isExemptFromSuppression(category, type) &&
-      equalApartFromVolatileKeys(*previous, message)) {
+  if (isRedundant(previous, category, type, message)) {
     kSessionLog.debug("dropping redundant event");
     outcome = Outcome::kRedundant;
   } else if (makeRoom(messages)) {

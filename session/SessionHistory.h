@@ -35,6 +35,12 @@ class SessionHistory {
   // next one like a recorded message.
   enum class Outcome : std::uint8_t { kRecorded, kRedundant, kNotStarted, kNoRoom };
 
+  // Returns true if a session drops a message because it repeats `previous`, the message of the
+  // same category and type before it; null if there is none. Pure: any thread may call.
+  [[nodiscard]] static bool isRedundant(const platform::Dictionary* previous,
+                                        AudioEventCategory category, AudioEventType type,
+                                        const platform::Dictionary& message);
+
   // Charges the history to `held`, which must outlive this. Log lines name the reporter.
   SessionHistory(ReporterID reporterID, ResourceTally& held)
       : reporterID_(reporterID), held_(held) {}

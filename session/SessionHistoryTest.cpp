@@ -43,6 +43,18 @@ TEST_F(SessionHistoryTest, RepetitionInARunIsRedundant) {
   EXPECT_EQ(history_.size(), 1U);
 }
 
+TEST_F(SessionHistoryTest, ARepetitionIsKnownWithoutAHistory) {
+  const Dictionary first{{"a", 1}, {"processuptime_ms", 1}};
+  const Dictionary again{{"a", 1}, {"processuptime_ms", 2}};
+  const Dictionary other{{"a", 2}, {"processuptime_ms", 1}};
+
+  EXPECT_TRUE(SessionHistory::isRedundant(&first, kPlayback, kStart, again));
+  EXPECT_FALSE(SessionHistory::isRedundant(&first, kPlayback, kStart, other));
+  EXPECT_FALSE(SessionHistory::isRedundant(nullptr, kPlayback, kStart, again));
+  EXPECT_FALSE(SessionHistory::isRedundant(&first, AudioEventCategory::kError, kStart, again));
+  EXPECT_FALSE(SessionHistory::isRedundant(&first, kPlayback, AudioEventType::kError, again));
+}
+
 TEST_F(SessionHistoryTest, EndReturnsTheHistoryAndItsCharge) {
   history_.begin();
   history_.record(kPlayback, kStart, Dictionary{{"a", 1}});
