@@ -81,7 +81,8 @@ SqliteCode MessageRecords::writeNext(TransactionAllowance& allowance) {
     payload = event->builder();
   }
   const std::string_view text = encoder_.encode(payload.entries(), payload.added());
-  // Count the payload of the two events of a message once, because they share its memory.
+  // Count the payload of the two events of a message once, because both hold the same message while
+  // they wait. Their payloads share its entries, unless the message has an application of its own.
   if (!encoder_.isRepeated()) writtenBytes_ += text.size();
   if (text.size() > longestPayload_) {
     ++port.tooLarge;

@@ -71,8 +71,8 @@ std::string_view PayloadEncoder::encode(const Dictionary& payload, const Diction
   const std::size_t shared = payload.sharedEntries(payload_);
   const bool hasSameEnd =
       added == nullptr ? !added_.has_value() : added_ && alikeEntries(*added_, *added);
-  isRepeated_ = text_.size() > 0 && hasSameEnd && payload.size() == payload_.size() &&
-                shared == payload.size();
+  const bool mayBeSame = text_.size() > 0 && hasSameEnd && payload.size() == payload_.size();
+  isRepeated_ = mayBeSame && shared == payload.size();
   if (isRepeated_) return text_.view();
   if (shared > 0) {
     // The events and the link message of one message.
@@ -82,7 +82,10 @@ std::string_view PayloadEncoder::encode(const Dictionary& payload, const Diction
     encodeFrom(shared);
   } else {
     const Dictionary previous = std::exchange(payload_, payload);
-    encodeLike(previous);
+    // The events of a message that has an application of its own are two dictionaries with equal
+    // entries.
+    const bool hasSameEntries = encodeLike(previous);
+    isRepeated_ = mayBeSame && hasSameEntries;
   }
   added_.reset();
   if (added != nullptr) {
@@ -112,13 +115,15 @@ void PayloadEncoder::appendKey(const Dictionary::Entry& entry, std::size_t posit
 }
 
 // Copies what the payload has at the same position as the previous one: runs of equal entries, and
-// the key of an entry whose value has changed. Encodes the rest.
-void PayloadEncoder::encodeLike(const Dictionary& previous) {
+// the key of an entry whose value has changed. Encodes the rest. Returns true if all entries of the
+// payload are in the previous one, at the same positions.
+bool PayloadEncoder::encodeLike(const Dictionary& previous) {
   std::swap(text_, previousText_);
   text_.truncate(0);
   const std::string_view old = previousText_.view();
   const std::size_t both = std::min(payload_.size(), previous.size());
   if (both == 0) text_.append('{');
+  bool isSame = both == payload_.size();
   std::size_t copied = 0;    // where the current run begins in the old text
   std::size_t oldStart = 1;  // where the entry begins in the old text, after the brace
   for (std::size_t position = 0; position < both; ++position) {
@@ -133,6 +138,7 @@ void PayloadEncoder::encodeLike(const Dictionary& previous) {
       const std::size_t offset = text_.size() - copied;
       place = {oldPlace.keyEnd + offset, oldPlace.end + offset};
     } else {
+      isSame = false;
       const std::size_t runEnd = hasSameKey ? oldPlace.keyEnd : oldStart;
       text_.appendPart(old.substr(copied, runEnd - copied));
       if (!hasSameKey) appendKey(entry, position);
@@ -148,6 +154,7 @@ void PayloadEncoder::encodeLike(const Dictionary& previous) {
   encodeFrom(both);
   // Free the memory of a large payload. It would otherwise stay allocated until the service ends.
   giveBackText(previousText_);
+  return isSame;
 }
 
 void PayloadEncoder::giveBack() {

@@ -32,8 +32,8 @@ class PayloadEncoder {
   // dictionary, which must not have its key. The text is valid until the next call. Cannot fail.
   [[nodiscard]] std::string_view encode(const Dictionary& payload,
                                         const Dictionary::Entry* added = nullptr);
-  // Returns true if the last call of encode() had the payload of the call before it and therefore
-  // returned the same text.
+  // Returns true if the last call of encode() had the payload of the call before it, or an equal
+  // one, and therefore returned the same text.
   [[nodiscard]] bool isRepeated() const { return isRepeated_; }
   // Forgets the last payload, and frees the memory that only a long text needed. The last text is
   // no longer valid.
@@ -48,7 +48,7 @@ class PayloadEncoder {
   };
 
   void encodeFrom(std::size_t first);
-  void encodeLike(const Dictionary& previous);
+  bool encodeLike(const Dictionary& previous);
   void appendKey(const Dictionary::Entry& entry, std::size_t position);
 
   JsonText text_;

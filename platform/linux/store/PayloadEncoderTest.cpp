@@ -192,6 +192,25 @@ TEST(PayloadEncoderTest, PayloadWithAnotherEndIsNoTwin) {
   EXPECT_FALSE(encoder.isRepeated());
 }
 
+TEST(PayloadEncoderTest, EqualPayloadsThatShareNothingAreRepetitions) {
+  const auto message = [](int number) {
+    return Dictionary{{"a", number}, {"b", "text"}, {"name", "app"}};
+  };
+  PayloadEncoder encoder;
+  const std::string first(encoder.encode(message(1)));
+  EXPECT_FALSE(encoder.isRepeated());
+
+  EXPECT_EQ(encoder.encode(message(1)), first);
+  EXPECT_TRUE(encoder.isRepeated());
+  EXPECT_NE(encoder.encode(message(2)), first);
+  EXPECT_FALSE(encoder.isRepeated());
+  const Dictionary::Entry added{"z", 1};
+  EXPECT_NE(encoder.encode(message(2), &added), first);
+  EXPECT_FALSE(encoder.isRepeated());
+  EXPECT_NE(encoder.encode({{"a", 2}, {"b", "text"}}, &added), first);
+  EXPECT_FALSE(encoder.isRepeated());
+}
+
 TEST(PayloadEncoderTest, LinkMessageWithOneMoreEntrySharesTheTextOfItsEvent) {
   Dictionary message;
   message.reserve(3);
