@@ -167,6 +167,10 @@ void PayloadEncoder::giveBack() {
   giveBackText(previousText_);
 }
 
+void PayloadEncoder::giveBackIfLong() {
+  if (text_.size() > kKeptBufferBytes) giveBack();
+}
+
 bool encodeAlike(const Dictionary& left, const Dictionary& right) {
   if (left.isIdenticalTo(right)) return true;
   return std::ranges::equal(left, right, alikeEntries);

@@ -38,6 +38,9 @@ class PayloadEncoder {
   // Forgets the last payload, and frees the memory that only a long text needed. The last text is
   // no longer valid.
   void giveBack();
+  // Does the same if the last text is longer than 256 KiB. For users that encode payload after
+  // payload without an end that they know of.
+  void giveBackIfLong();
 
  private:
   // The text of one entry, with the comma before it, ends at `end`, and its key with the colon at

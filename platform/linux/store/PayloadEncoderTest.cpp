@@ -211,6 +211,25 @@ TEST(PayloadEncoderTest, EqualPayloadsThatShareNothingAreRepetitions) {
   EXPECT_FALSE(encoder.isRepeated());
 }
 
+TEST(PayloadEncoderTest, LongTextIsForgottenOnRequestAndAShortOneKept) {
+  PayloadEncoder encoder;
+  const Dictionary message{{"a", 1}};
+  Dictionary longMessage{{"text", std::string(300'000, 'x')}};
+  EXPECT_EQ(encoder.encode(message), R"({"a":1})");
+  encoder.giveBackIfLong();
+  EXPECT_EQ(encoder.encode(message), R"({"a":1})");
+  EXPECT_TRUE(encoder.isRepeated());
+
+  EXPECT_EQ(encoder.encode(longMessage).size(), 300'011U);
+  encoder.giveBackIfLong();
+
+  // If the encoder shared the entries, changing one would copy them first.
+  const Dictionary::Entry* const before = longMessage.begin();
+  longMessage.setAt(0, 2);
+  EXPECT_EQ(longMessage.begin(), before);
+  EXPECT_EQ(encoder.encode(longMessage), R"({"text":2})");
+}
+
 TEST(PayloadEncoderTest, LinkMessageWithOneMoreEntrySharesTheTextOfItsEvent) {
   Dictionary message;
   message.reserve(3);

@@ -30,6 +30,10 @@ void SpannedRecordKind::onCommitted(FinishedRecords& finished) {
 }
 
 void SpannedRecordKind::endTransaction(FinishedRecords& finished) {
+  // Free the last record and the memory of its text, because the next record may come only after
+  // hours.
+  encoder_.giveBack();
+  if (!hasTaken()) static_cast<void>(forgetTaken());
   if (tooLarge_ > 0) {
     counters_.addDropped(DropReason::kTooLarge, tooLarge_);
     if (tooLargeLines_.tryPass()) logTooLarge(longestPayload_);

@@ -71,7 +71,8 @@ class SpannedRecordKind : public RecordKind {
  private:
   // Writes the next taken record.
   [[nodiscard]] virtual SqliteCode writeNext(TransactionAllowance& allowance) = 0;
-  // Frees all taken records, after a failed transaction. Returns how many were not written.
+  // Frees all taken records, after the last one was written or after a failed transaction. Returns
+  // how many were not written.
   virtual std::uint64_t forgetTaken() = 0;
   // Logs that a record was dropped because its payload was longer than that many bytes.
   virtual void logTooLarge(std::uint64_t longestPayload) const = 0;

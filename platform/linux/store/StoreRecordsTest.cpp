@@ -140,6 +140,21 @@ TEST_F(StoreRecordsTest, RecordsAfterClosingAreCountedAsDropped) {
   EXPECT_EQ(value("link local", "dropped: store closed"), 1U);
 }
 
+TEST_F(StoreRecordsTest, PayloadIsReleasedAfterItWasStored) {
+  start();
+  Dictionary payload{{"text", std::string(300'000, 'x')}};
+  store->powerEvents().add(
+      {.time = kNow, .categoryID = 1, .eventName = "long", .payload = payload});
+  store->close();
+  ASSERT_THAT(stored("SELECT count(*) FROM power_events"), ElementsAre("1"));
+
+  // If another object shared the entries, changing one would copy them first.
+  const Dictionary::Entry* const before = payload.begin();
+  payload.setAt(0, 1);
+
+  EXPECT_EQ(payload.begin(), before);
+}
+
 TEST_F(StoreRecordsTest, LockedDatabaseDropsAndCountsAllKinds) {
   start();
   ASSERT_TRUE(allIsStored());

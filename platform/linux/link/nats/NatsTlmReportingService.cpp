@@ -71,6 +71,7 @@ class NatsTlmReportingService::LinkedSession final : public TLMReportingSession 
     beginning_ += encoder().encode(sessionInfo);
     beginning_ += R"(,"userInfo":)";
     beginning_ += encoder().encode(userInfo);
+    encoder().giveBackIfLong();
     beginning_ += R"(,"category":)";
     const Value* const batch = sessionInfo.find(kTLMReportingSessionInfoBatchEvent);
     if (batch != nullptr && batch->toBool()) ledger_ = std::make_shared<AckLedger>();
@@ -141,6 +142,7 @@ TLMReportingOutcome NatsTlmReportingService::send(const LinkedSession& session,
   body += R"(,"payload":)";
   body += payload;
   body += '}';
+  encoder().giveBackIfLong();
   // The identifier is the same at each attempt. The stream therefore recognises a message that it
   // already has. Because of the random part, a restarted service does not use an identifier again.
   std::string id = instance_ + "-";
