@@ -64,7 +64,6 @@ class MessageBlocks {
     Statement insertBlock;
     Statement insertSpan;
     Statement newest;
-    Statement newestSpan;
     Statement openRows;
     Statement deleteOpenRows;
     Statement oldest;
