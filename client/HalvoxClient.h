@@ -209,6 +209,9 @@ class HalvoxConnection {
   Result<Dictionary> reporterIDValid(ReporterID id);
   // Returns the IDs of the sessions of all clients.
   Result<std::vector<ReporterID>> getAllReporters();
+  // Returns what the service has counted since its start: the number of each counter by "piece,
+  // name", such as "session, suppressed: redundant". A service of an earlier version refuses.
+  Result<Dictionary> getCounters();
   // Ends the service. The service does not answer this request. The result true means that the
   // connection has ended. Only root and the user that the service runs as may do this; others are
   // refused.

@@ -71,6 +71,13 @@ Result<bool> readBool(const Reply& reply) {
   return {value->toBool(), std::nullopt};
 }
 
+Result<Dictionary> readDictionary(Result<Reply>&& reply) {
+  if (!reply) return failed<Dictionary>(std::move(*reply.failure));
+  const auto value = reply.value->value("a{sv}");
+  if (!value) return failed<Dictionary>(senseless());
+  return {value->dictionary(), std::nullopt};
+}
+
 // The answer to a start, which comes when the session is stopped.
 struct HeldReply {
   std::uint32_t serial = 0;
@@ -268,11 +275,11 @@ Result<bool> HalvoxConnection::destroyReportingSession(ReporterID id) {
 }
 
 Result<Dictionary> HalvoxConnection::reporterIDValid(ReporterID id) {
-  auto answer = impl_->ask(makeRequest("reporterIDValid", id));
-  if (!answer) return failed<Dictionary>(std::move(*answer.failure));
-  const auto value = answer.value->value("a{sv}");
-  if (!value) return failed<Dictionary>(senseless());
-  return {value->dictionary(), std::nullopt};
+  return readDictionary(impl_->ask(makeRequest("reporterIDValid", id)));
+}
+
+Result<Dictionary> HalvoxConnection::getCounters() {
+  return readDictionary(impl_->ask(makeCountersRequest()));
 }
 
 Result<std::vector<ReporterID>> HalvoxConnection::getAllReporters() {

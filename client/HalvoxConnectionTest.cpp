@@ -60,6 +60,12 @@ TEST_F(HalvoxConnectionTest, QueriesGiveWhatTheServiceAnswers) {
   EXPECT_EQ(connection_->getAllReporters().value, (std::vector<ReporterID>{-3, 7}));
 }
 
+TEST_F(HalvoxConnectionTest, CountersHaveTheirPieceAndName) {
+  connection_->sendMessage({{"n", 1}}, 4, 1, std::nullopt);
+
+  EXPECT_EQ(connection_->getCounters().value, (Dictionary{{"messages, received", 1}}));
+}
+
 TEST_F(HalvoxConnectionTest, MessagesArriveWithCategoryTypeAndRecipients) {
   connection_->sendMessage({{"n", 1}}, 0x08000004, 17, {{7, 8}});
   connection_->sendMessage({}, 4, 1, std::vector<ReporterID>{});

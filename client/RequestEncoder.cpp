@@ -19,6 +19,7 @@ using dbus::HeaderField;
 
 constexpr std::string_view kObjectPath = "/com/tarno/halvox/reporting";
 constexpr std::string_view kInterface = "com.tarno.halvox.HVReportingServiceProtocol";
+constexpr std::string_view kStatisticsInterface = "com.tarno.halvox.Statistics";
 
 // ---- Headers
 
@@ -61,7 +62,8 @@ struct Header {
   }
 };
 
-constexpr Header makeHeader(std::string_view member, std::string_view signature) {
+constexpr Header makeHeader(std::string_view member, std::string_view signature,
+                            std::string_view interface = kInterface) {
   Header header;
   header.byte(std::endian::native == std::endian::little ? 'l' : 'B');
   header.byte(static_cast<char>(dbus::MessageType::kMethodCall));
@@ -69,7 +71,7 @@ constexpr Header makeHeader(std::string_view member, std::string_view signature)
   header.byte(static_cast<char>(dbus::kProtocolVersion));
   header.size = dbus::kFrameStartBytes;
   header.field(HeaderField::kPath, 'o', kObjectPath);
-  header.field(HeaderField::kInterface, 's', kInterface);
+  header.field(HeaderField::kInterface, 's', interface);
   header.field(HeaderField::kMember, 's', member);
   if (!signature.empty()) header.signature(signature);
   header.put(dbus::kFieldsLengthOffset,
@@ -213,6 +215,10 @@ Request makeRequest(const MessageView& message) {
 
 Request makeRequest(const char* member) {
   return make(makeHeader(member, ""), [](SegmentWriter&) {});
+}
+
+Request makeCountersRequest() {
+  return make(makeHeader("GetCounters", "", kStatisticsInterface), [](SegmentWriter&) {});
 }
 
 Request makeRequest(const char* member, ReporterID id) {

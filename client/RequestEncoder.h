@@ -51,6 +51,8 @@ Request makeRequest(const char* member);
 Request makeRequest(const char* member, ReporterID id);
 Request makeRequest(const SessionOperation& operation);
 Request makeRequest(const MessageView& message);
+// The request for the service's counters, which has an interface of its own.
+Request makeCountersRequest();
 
 // Sets the serial of a frame. It must not be 0. At least the first 12 bytes of the frame must be at
 // `frame`.

@@ -197,7 +197,8 @@ int TestService::answer(Connection& connection, sd_bus_message* message) {
     leaving_ = true;
     return 0;
   }
-  if (call.member == "reporterIDValid" || call.member.starts_with("get")) {
+  if (call.member == "reporterIDValid" || call.member.starts_with("get") ||
+      call.member == "GetCounters") {
     return answerQuery(message, call);
   }
   return answerSessionRequest(connection, message, call);
@@ -238,6 +239,10 @@ int TestService::answerQuery(sd_bus_message* message, const RecordedCall& call) 
     sd_bus_message_new_method_return(message, reply.out());
     sd_bus_message_append_array(reply.get(), 'x', ids.data(), ids.size() * sizeof(ReporterID));
     return sd_bus_send(nullptr, reply.get(), nullptr);
+  }
+  if (call.member == "GetCounters") {
+    const auto received = static_cast<std::uint64_t>(count("sendMessage"));
+    return sd_bus_reply_method_return(message, "a{sv}", 1, "messages, received", "t", received);
   }
   const ReporterID id = call.arguments.empty() ? 0 : call.arguments.front().toInt64();
   const Session* session = find(id);

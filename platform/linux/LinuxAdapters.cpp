@@ -2,6 +2,7 @@
 
 #include <filesystem>
 #include <utility>
+#include <vector>
 
 #include "platform/linux/configuration/ConfigurationEnvironment.h"
 #include "platform/linux/drivers/ConfiguredSources.h"
@@ -25,6 +26,16 @@ ConnectionOptions connectionOptions(const Configuration& configuration) {
   options.clientSessions = configuration.limits.clientSessions;
   options.messageReporterIDs = configuration.limits.messageReporterIDs;
   return options;
+}
+
+Dictionary readCounters(const CounterStatisticsService& statistics) {
+  const std::vector<CounterReading> readings = statistics.snapshot();
+  Dictionary counters;
+  counters.reserve(readings.size());
+  for (const CounterReading& reading : readings) {
+    counters.add(reading.piece + ", " + reading.name, reading.value);
+  }
+  return counters;
 }
 
 StoreOptions storeOptions(const Configuration& configuration) {
@@ -88,6 +99,7 @@ LinuxAdapters::LinuxAdapters(const Configuration& settings, std::function<void()
             // while other threads are woken.
             options.afterReplies = [this] { dispatch.wakePool(); };
             options.onReportSignal = std::move(onReportSignal);
+            options.counters = [this] { return readCounters(statistics); };
             return options;
           }(),
           backpressure),

@@ -16,6 +16,7 @@
 #include "platform/linux/connection/BusAddress.h"
 #include "platform/linux/connection/ConnectionLimits.h"
 #include "platform/linux/dispatch/Backpressure.h"
+#include "platform/value.h"
 
 namespace halvox::platform::linux_ {
 
@@ -62,6 +63,9 @@ struct ConnectionOptions {
   std::function<void()> afterReplies;
   // Called on the I/O thread at SIGUSR1, if `signals` is kHandle.
   std::function<void()> onReportSignal;
+  // Called on the I/O thread for each client that asks for the counters. Returns the value of each
+  // counter by "piece, name". Without it the service answers with no counters.
+  std::function<Dictionary()> counters;
 };
 
 // Why open() failed. The message of the failure is one line for the user.

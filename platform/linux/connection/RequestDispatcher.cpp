@@ -74,7 +74,7 @@ struct RequestDispatcher::Request {
 RequestDispatcher::RequestDispatcher(const ConnectionOptions& options,
                                      ConnectionStatistics& statistics,
                                      const ServiceIdentity& identity)
-    : options_(options), statistics_(statistics), standard_(identity) {
+    : options_(options), statistics_(statistics), standard_(identity, options.counters) {
   scratch_.caches = std::make_unique<dbus::DecodeCaches>();
 }
 
@@ -206,7 +206,8 @@ void RequestDispatcher::answerStandard(const Request& request, const StandardMet
   const StandardAnswer answer = method.answer({.client = request.client,
                                                .path = header.path,
                                                .arguments = arguments_,
-                                               .identity = standard_.identity()});
+                                               .identity = standard_.identity(),
+                                               .counters = standard_.counters()});
   arguments_.clear();
   if (isAnswerUnwanted(header)) return;
   statistics_.repliesGiven.add();

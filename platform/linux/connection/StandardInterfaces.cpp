@@ -13,6 +13,7 @@ namespace {
 constexpr std::string_view kPeer = "org.freedesktop.DBus.Peer";
 constexpr std::string_view kIntrospectable = "org.freedesktop.DBus.Introspectable";
 constexpr std::string_view kProperties = "org.freedesktop.DBus.Properties";
+constexpr std::string_view kStatistics = "com.tarno.halvox.Statistics";
 
 StandardAnswer ping(const StandardRequest& /*request*/) { return {}; }
 
@@ -38,6 +39,11 @@ StandardAnswer noProperties(const StandardRequest& /*request*/) {
   return {.value = Value(Dictionary{})};
 }
 
+// Read at each request and never kept: while nobody asks, the counters cost nothing.
+StandardAnswer getCounters(const StandardRequest& request) {
+  return {.value = Value(request.counters ? request.counters() : Dictionary{})};
+}
+
 // Keep the methods of one interface together, because the introspection writes one interface
 // element for each run of methods with the same interface.
 //
@@ -49,6 +55,7 @@ constexpr std::array kObjectMethods = {
     StandardMethod{kProperties, "Get", "ss", "v", StandardScope::kObject, unknownProperty},
     StandardMethod{kProperties, "GetAll", "s", "a{sv}", StandardScope::kObject, noProperties},
     StandardMethod{kProperties, "Set", "ssv", "", StandardScope::kObject, unknownProperty},
+    StandardMethod{kStatistics, "GetCounters", "", "a{sv}", StandardScope::kObject, getCounters},
 };
 
 bool isExportedObject(const ClientConnection& client, std::string_view path) {

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <functional>
 #include <span>
 #include <string>
 #include <string_view>
@@ -19,6 +20,9 @@ struct ServiceIdentity {
   std::string machineHex;  // 32 hexadecimal digits; empty if the machine has no ID
 };
 
+// Reads the counters of the service; see ConnectionOptions::counters.
+using CounterReader = std::function<Dictionary()>;
+
 // The answer of a standard method: a value, or an error when `errorName` is not empty.
 struct StandardAnswer {
   Value value{};
@@ -32,6 +36,7 @@ struct StandardRequest {
   std::string_view path;
   std::span<const Value> arguments;
   const ServiceIdentity& identity;
+  const CounterReader& counters;
 };
 
 // Which objects have a standard method.
@@ -52,7 +57,7 @@ struct StandardMethod {
 };
 
 // The methods that the adapter answers itself.
-std::span<const StandardMethod> objectMethods();  // Peer, Introspectable and Properties
+std::span<const StandardMethod> objectMethods();  // of the interfaces that the object has
 std::span<const StandardMethod> busMethods();     // what a client asks its bus for
 
 // Which part of a request names something that does not exist.
@@ -60,11 +65,17 @@ enum class UnknownPart : std::uint8_t { kObject, kInterface, kMethod };
 
 // The interfaces of D-Bus itself, which the adapter answers on behalf of the exported object.
 // Client libraries make a few calls to the bus. For clients on our own socket, which has no bus,
-// the adapter answers these calls, too, and the libraries then work unchanged. Belongs to the I/O
-// thread. Owned by the dispatcher. Does not own the identity.
+// the adapter answers these calls, too, and the libraries then work unchanged.
+//
+// One interface is our own: com.tarno.halvox.Statistics, whose GetCounters answers what the service
+// has counted since its start. It is not part of the exported object, because the counters belong
+// to the platform and not to the protocol.
+//
+// Belongs to the I/O thread. Owned by the dispatcher. Does not own its arguments.
 class StandardInterfaces {
  public:
-  explicit StandardInterfaces(const ServiceIdentity& identity) : identity_(identity) {}
+  StandardInterfaces(const ServiceIdentity& identity, const CounterReader& counters)
+      : identity_(identity), counters_(counters) {}
 
   // Returns the standard method that a request asks for, or null if it asks for none.
   [[nodiscard]] const StandardMethod* find(const ClientConnection& client,
@@ -74,9 +85,11 @@ class StandardInterfaces {
   [[nodiscard]] UnknownPart unknownPartOf(const ClientConnection& client,
                                           const dbus::MessageHeader& request) const;
   [[nodiscard]] const ServiceIdentity& identity() const { return identity_; }
+  [[nodiscard]] const CounterReader& counters() const { return counters_; }
 
  private:
   const ServiceIdentity& identity_;
+  const CounterReader& counters_;
 };
 
 // Returns true if `path` is a parent of `objectPath`. The root is a parent of all others.

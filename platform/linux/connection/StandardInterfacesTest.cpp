@@ -22,6 +22,7 @@ using testing::Not;
 constexpr const char* kBus = "org.freedesktop.DBus";
 constexpr const char* kBusPath = "/org/freedesktop/DBus";
 constexpr const char* kProperties = "org.freedesktop.DBus.Properties";
+constexpr const char* kStatistics = "com.tarno.halvox.Statistics";
 constexpr const char* kServiceName = "com.tarno.halvox.reporting";
 
 // Returns what a command prints on its standard output and standard error. Only for the test's own
@@ -100,6 +101,27 @@ TEST(StandardInterfacesTest, ThereAreNoProperties) {
   EXPECT_EQ(client.callAt(kTestPath, kProperties, "GetAll", {kTestInterface}).text, "a{sv}");
   EXPECT_EQ(client.callAt(kTestPath, kProperties, "Get", {kTestInterface, "Color"}).errorName,
             "org.freedesktop.DBus.Error.UnknownProperty");
+}
+
+TEST(StandardInterfacesTest, CountersAreReadWhenAClientAsks) {
+  std::uint64_t reads = 0;
+  const ServiceUnderTest service([&](ConnectionOptions& options) {
+    options.counters = [&reads] { return Dictionary{{"store, received", ++reads}}; };
+  });
+  BusClient client(service.address());
+  EXPECT_EQ(reads, 0U);
+
+  EXPECT_EQ(client.callAt(kTestPath, kStatistics, "GetCounters").text, "a{sv}");
+  EXPECT_EQ(reads, 1U);
+  EXPECT_EQ(client.callAt("/", kStatistics, "GetCounters").errorName,
+            "org.freedesktop.DBus.Error.UnknownInterface");
+}
+
+TEST(StandardInterfacesTest, AServiceThatReadsNoCountersAnswersWithNone) {
+  const ServiceUnderTest service;
+  BusClient client(service.address());
+
+  EXPECT_EQ(client.callAt(kTestPath, kStatistics, "GetCounters").errorName, "");
 }
 
 TEST(StandardInterfacesTest, EveryPeerGetsAUniqueNameOnce) {
