@@ -228,6 +228,11 @@ void MessageJoin::forgetSummary(std::int64_t sessionID, std::uint64_t number) {
   if (place != end) summaries_.erase(place);
 }
 
+void MessageJoin::deliverBefore(double time) {
+  while (!waiting_.empty() && waiting_.front().message.time < time) deliverFirst();
+  deliverReady(time);
+}
+
 void MessageJoin::finish() {
   while (!waiting_.empty()) deliverFirst();
 }

@@ -58,6 +58,9 @@ class MessageJoin {
 
   // Takes the next event or link message; ignores other kinds.
   void add(const Record& record);
+  // Delivers the messages that were recorded before that time, in seconds since 1970, and have not
+  // found their other record. A record that comes later becomes a message of its own.
+  void deliverBefore(double time);
   // Delivers the messages that still wait. Call once, after the last record.
   void finish();
 

@@ -78,6 +78,18 @@ TEST_F(MessageJoinTest, ALongSummaryDoesNotDisplaceTheMessagesThatWait) {
   EXPECT_THAT(delivered, ElementsAre(1, 3));
 }
 
+TEST_F(MessageJoinTest, AMessageWithoutItsOtherRecordIsDeliveredOnRequest) {
+  records.at(100).event({}, "Session_Playback", "Start");
+  records.at(102).event({}, "Session_Playback", "Stop");
+  addAll();
+  EXPECT_THAT(delivered, IsEmpty());
+
+  join.deliverBefore(101);
+  EXPECT_THAT(delivered, ElementsAre(1));
+  join.deliverBefore(103);
+  EXPECT_THAT(delivered, ElementsAre(1, 3));
+}
+
 TEST_F(MessageJoinTest, TheBytesOfWaitingMessagesAreBounded) {
   const std::string text(1U << 20U, 'x');
   constexpr std::size_t kMessages = 20;

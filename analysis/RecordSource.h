@@ -50,6 +50,7 @@ struct Record {
 struct RecordRange {
   std::optional<double> since;
   std::optional<double> until;
+  std::int64_t after = 0;  // only messages that were stored after this record
   bool messages = true;
   bool metrics = false;
   bool power = false;

@@ -82,6 +82,7 @@ store::Result<void> StoreRecordSource::forEach(const RecordRange& range, const C
   RecordFilter filter;
   filter.since = range.since;
   filter.until = range.until;
+  filter.after = range.after;
   RecordMaker maker;
   const auto read =
       reader_.forEachItem({.messages = range.messages,

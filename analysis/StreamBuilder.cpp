@@ -256,6 +256,11 @@ void StreamBuilder::closeAll(StreamEnd end, double time) {
   }
 }
 
+void StreamBuilder::settle(double time) {
+  join_.deliverBefore(time);
+  settleUndecided(time);
+}
+
 void StreamBuilder::finish(const Finish& finish) {
   join_.finish();
   settleUndecided(lastTime_ + 2 * kSameMoment);

@@ -78,6 +78,9 @@ class StreamBuilder {
 
   // Takes the next record; ignores kinds other than events and link messages.
   void add(const Record& record) { join_.add(record); }
+  // Takes the messages that were recorded before that time, although their other record may be
+  // missing. Only for a view of what happens now, which must not wait for the next record.
+  void settle(double time);
   // Delivers the stories that are open. Call once, after the last record.
   void finish(const Finish& finish);
 

@@ -122,14 +122,15 @@ class StoreReader {
 
   // Calls `callback` on this thread for each record of several kinds within a range of time. Events
   // and link messages come in the order of storing; the other kinds are merged with them by time.
-  // Uses only the times of the filter. Does not change lastRead(). Memory does not grow with the
-  // store.
+  // Uses only the times of the filter and, for messages, `after`: a value of lastRead() makes this
+  // call read the messages that were stored since. Sets lastRead() if messages are read. Memory
+  // does not grow with the store.
   Result<void, StoreError> forEachItem(const StoredKinds& kinds, const RecordFilter& filter,
                                        const ItemCallback& callback);
 
-  // Returns the last record that the last successful call of forEachEvent() or forEachRecord()
-  // looked at, whether or not it passed the filter. A call that continues after that record misses
-  // none.
+  // Returns the last record that the last successful call of forEachEvent(), forEachRecord() or,
+  // for messages, forEachItem() looked at, whether or not it passed the filter. A call of the same
+  // function that continues after that record misses none.
   [[nodiscard]] StoredRecordID lastRead() const { return lastRead_; }
 
   // Returns true if no store is open, or if the path leads to another database or to none now. Then

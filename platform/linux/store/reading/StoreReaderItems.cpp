@@ -67,6 +67,9 @@ class BlockCursor final : public ItemCursor {
     return SQLITE_OK;
   }
 
+  // Returns the number of the last record of the pass. Known after begin().
+  [[nodiscard]] StoredRecordID last() const { return scan_.last(); }
+
  private:
   BlockScan scan_;
   bool found_ = false;
@@ -158,7 +161,8 @@ class RowCursor final : public ItemCursor {
 
 using Cursors = std::vector<std::unique_ptr<ItemCursor>>;
 
-Cursors cursorsFor(Database& database, std::int64_t version, const StoredKinds& kinds,
+// Returns the cursors of everything but the messages in blocks.
+Cursors rowCursors(Database& database, std::int64_t version, const StoredKinds& kinds,
                    const RecordFilter& filter) {
   Cursors cursors;
   // If an older service made the store, it may lack the table and has no such records then.
@@ -168,9 +172,6 @@ Cursors cursorsFor(Database& database, std::int64_t version, const StoredKinds& 
   };
   if (kinds.messages) cursors.push_back(std::make_unique<EventCursor>(database, filter));
   addRows(kinds.messages, kLinkMessages);
-  if (kinds.messages && version >= kBlocksSinceVersion) {
-    cursors.push_back(std::make_unique<BlockCursor>(database, filter));
-  }
   addRows(kinds.metrics, kIssueMetrics);
   addRows(kinds.power, kPowerEvents);
   addRows(kinds.snapshots, kSnapshots);
@@ -200,7 +201,18 @@ Result<void, StoreError> StoreReader::forEachItem(const StoredKinds& kinds,
   RecordFilter times;
   times.since = filter.since;
   times.until = filter.until;
-  const Cursors cursors = cursorsFor(database_, *version, kinds, times);
+  // New messages go into blocks, whose numbers continue after those of the old tables.
+  StoredKinds kindsInRows = kinds;
+  kindsInRows.messages = kinds.messages && filter.after == 0;
+  Cursors cursors = rowCursors(database_, *version, kindsInRows, times);
+  RecordFilter newer = times;
+  newer.after = filter.after;
+  const BlockCursor* blocks = nullptr;
+  if (kinds.messages && *version >= kBlocksSinceVersion) {
+    auto cursor = std::make_unique<BlockCursor>(database_, newer);
+    blocks = cursor.get();
+    cursors.push_back(std::move(cursor));
+  }
   const auto failed = [&](const ItemCursor& cursor, SqliteCode code) {
     // SQLite does not notice damage inside a block and has no text for it.
     return code == SQLITE_CORRUPT && sqlite3_errcode(database_.get()) != SQLITE_CORRUPT
@@ -217,6 +229,7 @@ Result<void, StoreError> StoreReader::forEachItem(const StoredKinds& kinds,
     const SqliteCode code = cursor->advance();
     if (code != SQLITE_OK) return failed(*cursor, code);
   }
+  if (kinds.messages) lastRead_ = blocks == nullptr ? 0 : std::max(filter.after, blocks->last());
   return {};
 }
 

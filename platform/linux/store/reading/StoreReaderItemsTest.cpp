@@ -62,6 +62,37 @@ TEST_F(StoreReaderItemsTest, ReadsOnlyTheRangeOfTime) {
   EXPECT_THAT(read({}, {.since = 5000}), IsEmpty());
 }
 
+TEST_F(StoreReaderItemsTest, ReadsOnlyTheMessagesThatWereStoredSince) {
+  start();
+  sendAt(1000, 1);
+  linkAt(1001, 2);
+  ASSERT_TRUE(allIsStored());
+  StoreReader reader;
+  ASSERT_TRUE(reader.open(options.directory));
+  std::vector<std::string> found;
+  const auto readMore = [&] {
+    found.clear();
+    EXPECT_TRUE(reader.forEachItem({}, {.after = reader.lastRead()}, [&](const StoredItem& item) {
+      found.emplace_back(item.payload);
+    }));
+  };
+  readMore();
+  EXPECT_THAT(found, SizeIs(2));
+
+  readMore();
+  EXPECT_THAT(found, IsEmpty());
+
+  // More than a block holds, so that rows are joined between the calls.
+  for (int number = 0; number < 3000; ++number) sendAt(1002, number);
+  ASSERT_TRUE(allIsStored());
+  readMore();
+  EXPECT_THAT(found, SizeIs(3000));
+  sendAt(999, 4);
+  ASSERT_TRUE(allIsStored());
+  readMore();
+  EXPECT_THAT(found, ElementsAre(numbered(4)));
+}
+
 TEST_F(StoreReaderItemsTest, ReadsNoMessagesUnlessAsked) {
   start();
   sendAt(1000, 1);
