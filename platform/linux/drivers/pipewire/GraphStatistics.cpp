@@ -104,11 +104,15 @@ void GraphStatistics::cycleEnded(const pipewire::ProfiledCycle& cycle) {
   driver = {.lastCycle = cycle.time, .xruns = cycle.driverXruns};
   if (auto* node = find(cycle.driver->id)) {
     if (!isRepeated) node->cycleEnded(*cycle.driver);
+    node->clockIs(cycle.quantum, cycle.rate);
     node->xrunsHappened(xruns);
   }
   if (isRepeated) return;
   for (const pipewire::ProfiledNode& follower : cycle.followers) {
-    if (auto* node = find(follower.id)) node->cycleEnded(follower);
+    auto* const node = find(follower.id);
+    if (node == nullptr) continue;
+    node->cycleEnded(follower);
+    node->clockIs(cycle.quantum, cycle.rate);
   }
   for (const pipewire::ProfiledLateNode& late : cycle.late) {
     if (auto* node = find(late.id)) node->xrunsHappened(1);

@@ -88,6 +88,24 @@ TEST_F(GraphStatisticsTest, ACycleCountsForItsDriverAndForEachFollower) {
   EXPECT_THAT(read("microphone/Rx/PipeWire/wait"), ElementsAre(EndsWith("min 0 max 50")));
 }
 
+TEST_F(GraphStatisticsTest, TheClockIsThatOfTheLastCycleAndInAGroupOfItsOwn) {
+  graph.nodeAdded(30, "Audio/Sink", "speakers");
+  graph.nodeAdded(40, "Audio/Source", "microphone");
+  ProfiledCycle known = cycle(1s);
+  known.quantum = 1024;
+  known.rate = 44'100;
+  graph.cycleEnded(known);
+  known.time = 2s;
+  known.quantum = 256;
+  known.rate = 48'000;
+  graph.cycleEnded(known);
+  graph.cycleEnded(cycle(3s));
+
+  for (const std::string node : {"speakers/Clock/Speaker", "microphone/Clock/Rx"}) {
+    EXPECT_THAT(read(node), ElementsAre(node + "/quantum frames = 256", node + "/rate Hz = 48000"));
+  }
+}
+
 TEST_F(GraphStatisticsTest, ACycleThatIsReportedTwiceCountsOnceWithItsXruns) {
   graph.nodeAdded(30, "Audio/Sink", "speakers");
   graph.nodeAdded(40, "Audio/Sink", "more");

@@ -12,6 +12,9 @@ namespace halvox::platform::linux_ {
 inline constexpr const char* kSinkGroup = "Speaker";
 inline constexpr const char* kSourceGroup = "Rx";
 inline constexpr const char* kPipeWireSubGroup = "PipeWire";
+// The group of what the clock of a sink or source is set to. No session reports this group: these
+// values are settings and not counts.
+inline constexpr const char* kClockGroup = "Clock";
 
 // Describes a counter of this source. The caller changes the format for other channels.
 inline ChannelDescription describeNodeChannel(std::string group, std::string driver,

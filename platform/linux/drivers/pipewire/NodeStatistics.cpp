@@ -19,6 +19,16 @@ ChannelList::Channel makeSimple(const std::string& group, const std::string& dri
   return makeChannel(describeNodeChannel(group, driver, std::move(name)));
 }
 
+// A sink and a source may have one name. Their group is therefore the subgroup here.
+ChannelList::Channel makeGauge(const std::string& group, const std::string& driver,
+                               std::string name, std::string unit) {
+  ChannelDescription channel = describeNodeChannel(kClockGroup, driver, std::move(name));
+  channel.subGroup = group;
+  channel.kind = IOReportKind::kGauge;
+  channel.unitLabel = std::move(unit);
+  return makeChannel(std::move(channel));
+}
+
 ChannelList::Channel makeHistogram(const std::string& group, const std::string& driver,
                                    std::string name) {
   ChannelDescription channel = describeNodeChannel(group, driver, std::move(name));
@@ -91,12 +101,21 @@ NodeStatistics::NodeStatistics(const std::string& group, const std::string& driv
       xrunsChannel_(makeSimple(group, driverName, "xruns")),
       busyChannel_(makeHistogram(group, driverName, "busy time")),
       waitChannel_(makeHistogram(group, driverName, "wait time")),
-      stateChannel_(makeState(group, driverName, "state")) {}
+      stateChannel_(makeState(group, driverName, "state")),
+      quantumChannel_(makeGauge(group, driverName, "quantum", "frames")),
+      rateChannel_(makeGauge(group, driverName, "rate", "Hz")) {}
 
 void NodeStatistics::cycleEnded(const pipewire::ProfiledNode& node) {
   ++cycles_;
   if (node.wait.has_value()) wait_.add(*node.wait);
   if (node.busy.has_value()) busy_.add(*node.busy);
+}
+
+void NodeStatistics::clockIs(std::int64_t quantum, std::int64_t rate) {
+  // A cycle that does not say is no reason to forget what earlier ones said.
+  if (quantum <= 0 || rate <= 0) return;
+  quantum_ = static_cast<std::uint64_t>(quantum);
+  rate_ = static_cast<std::uint64_t>(rate);
 }
 
 void NodeStatistics::addTo(ReadingMaker& maker, Time now) const {
@@ -105,6 +124,9 @@ void NodeStatistics::addTo(ReadingMaker& maker, Time now) const {
   maker.add(busyChannel_, busy_.values());
   maker.add(waitChannel_, wait_.values());
   maker.add(stateChannel_, states_.values(now));
+  if (quantum_ == 0) return;
+  maker.add(quantumChannel_, std::span(&quantum_, 1));
+  maker.add(rateChannel_, std::span(&rate_, 1));
 }
 
 }  // namespace halvox::platform::linux_

@@ -70,6 +70,8 @@ class NodeStatistics {
   NodeStatistics(const std::string& group, const std::string& driverName);
 
   void cycleEnded(const pipewire::ProfiledNode& node);
+  // The length of a cycle in frames, and the frames per second.
+  void clockIs(std::int64_t quantum, std::int64_t rate);
   void xrunsHappened(std::uint32_t count) { xruns_ += count; }
   void stateChanged(std::optional<NodeState> state, Time now) { states_.change(state, now); }
   // The node has disappeared. Its counts continue if a node of the same name appears.
@@ -84,11 +86,15 @@ class NodeStatistics {
   ChannelList::Channel busyChannel_;
   ChannelList::Channel waitChannel_;
   ChannelList::Channel stateChannel_;
+  ChannelList::Channel quantumChannel_;
+  ChannelList::Channel rateChannel_;
   std::uint64_t cycles_ = 0;
   std::uint64_t xruns_ = 0;
   DurationHistogram busy_;
   DurationHistogram wait_;
   StateResidency states_;
+  std::uint64_t quantum_ = 0;  // unknown
+  std::uint64_t rate_ = 0;
 };
 
 }  // namespace halvox::platform::linux_
