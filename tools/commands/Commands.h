@@ -13,6 +13,7 @@ void addRecordCommands(CommandSet& commands);    // events, metrics, power, link
 void addFieldCommand(CommandSet& commands);      // fields
 void addQueryCommands(CommandSet& commands);     // sql
 void addExportCommand(CommandSet& commands);     // export
+void addTopCommand(CommandSet& commands);        // top
 void addStreamCommands(CommandSet& commands);    // streams
 void addReportCommand(CommandSet& commands);     // report
 void addSnapshotCommands(CommandSet& commands);  // snapshots
