@@ -397,6 +397,8 @@ TEST(CommandLineTest, ExportTakesKindsAndApplications) {
 TEST(CommandLineTest, ExportNamesTheFormsThatItHas) {
   EXPECT_NE(errorOf({"export", "--to", "f", "--format", "xml"}).find("sqlite"), std::string::npos);
   EXPECT_NE(errorOf({"export"}).find("--output"), std::string::npos);
+  EXPECT_NE(errorOf({"export", "--format", "perfetto", "--kind", "link"}).find("shows streams"),
+            std::string::npos);
 }
 
 // The completion is a separate file, in which a new command is easily forgotten.

@@ -1,25 +1,37 @@
 #include "tools/Export.h"
 
+#include <chrono>
 #include <cstdint>
 #include <filesystem>
 #include <functional>
 #include <memory>
+#include <sstream>
 #include <system_error>
 #include <utility>
 #include <variant>
+
+#include "analysis/StoreRecordSource.h"
+#include "analysis/StreamBuilder.h"
+#include <unistd.h>
 
 #include "platform/linux/runtime/Version.h"
 #include "platform/linux/store/reading/StoreExport.h"
 #include "platform/value.h"
 #include "tools/Complaint.h"
 #include "tools/JsonText.h"
+#include "tools/ServiceConfiguration.h"
 #include "tools/StoreRun.h"
+#include "tools/StreamFinish.h"
+#include "tools/TraceResults.h"
 #include "tools/export/ApplicationFilter.h"
 #include "tools/export/CsvWriter.h"
 #include "tools/export/ExportOutput.h"
 #include "tools/export/ExportProgress.h"
 #include "tools/export/JsonlWriter.h"
 #include "tools/export/OtlpWriter.h"
+#include "tools/export/PerfettoIntervals.h"
+#include "tools/export/PerfettoStreams.h"
+#include "tools/export/PerfettoTrace.h"
 
 namespace halvox::tools {
 namespace {
@@ -35,6 +47,11 @@ constexpr std::string_view kStandardOutput = "-";
 // Enough that writing costs little beside reading.
 constexpr std::size_t kBytesPerWrite = std::size_t{256} << 10U;
 
+double now() {
+  const auto time = std::chrono::system_clock::now().time_since_epoch();
+  return std::chrono::duration<double>(time).count();
+}
+
 // Why an export ended early, and with which status.
 struct ExportFailure {
   ExitStatus status;
@@ -44,24 +61,52 @@ struct ExportFailure {
 // One run of the command.
 class Export {
  public:
-  Export(const ExportRecords& request, StoreReader& reader, const ToolStreams& streams)
+  Export(const ExportRecords& request, StoreReader& reader, const fs::path& directory,
+         const ToolStreams& streams)
       : request_(request),
         reader_(reader),
+        directory_(directory),
         streams_(streams),
         progress_(streams.errors, streams.isErrorTerminal ? ExportProgress::Shown::kAtTerminal
                                                           : ExportProgress::Shown::kNever) {}
 
   std::optional<ExportFailure> run() {
-    auto failure = request_.format == ExportFormat::kSqlite ? toDatabase() : toText();
+    auto failure = write();
     progress_.clear();
     return failure;
   }
   // What a person or a program is shown at the end.
-  [[nodiscard]] Dictionary totals() const { return {{"file", request_.to}, {"records", records_}}; }
-  [[nodiscard]] std::string summary() const { return std::to_string(records_) + " records"; }
+  [[nodiscard]] Dictionary totals() const {
+    if (request_.format != ExportFormat::kPerfetto) {
+      return {{"file", request_.to}, {"records", records_}};
+    }
+    return {{"file", request_.to},
+            {"streams", streamCount_},
+            {"xruns", xruns_},
+            {"trace_intervals", intervals_}};
+  }
+  [[nodiscard]] std::string summary() const {
+    if (request_.format != ExportFormat::kPerfetto) return std::to_string(records_) + " records";
+    return std::to_string(streamCount_) + " streams, " + std::to_string(xruns_) + " xruns" +
+           (intervals_ > 0 ? ", " + std::to_string(intervals_) + " trace intervals" : "");
+  }
 
  private:
   using Handler = std::function<Result<void>(const StoredItem&)>;
+
+  std::optional<ExportFailure> write() {
+    switch (request_.format) {
+      case ExportFormat::kSqlite:
+        return toDatabase();
+      case ExportFormat::kJsonl:
+      case ExportFormat::kCsv:
+      case ExportFormat::kOtlpJson:
+        return toText();
+      case ExportFormat::kPerfetto:
+        return toTrace();
+    }
+    return std::nullopt;
+  }
 
   std::optional<ExportFailure> toDatabase() {
     StoreExport file(request_.to);
@@ -91,6 +136,63 @@ class Export {
     auto written = write(1);
     if (written) written = output->finish();
     return cannotWrite(written);
+  }
+
+  std::optional<ExportFailure> toTrace() {
+    const auto output = makeOutput();
+    std::string text;
+    PerfettoTrace trace(text);
+    PerfettoStreams shown(trace, {.applications = request_.applications, .since = request_.since});
+    analysis::StreamBuilder builder(
+        [&](const analysis::StreamStory& story) { shown.onStory(story); },
+        [&](const analysis::StreamStory& story, const analysis::StreamMoment& moment) {
+          shown.onMoment(story, moment);
+        });
+    trace.begin(PerfettoTrace::timeOf(request_.since.value_or(now())));
+    Result<void> written;
+    analysis::StoreRecordSource source(reader_);
+    // All messages: a stream that ran in the time that was asked for may have begun long before it.
+    const auto read = source.forEach({.since = std::nullopt, .until = request_.until},
+                                     [&](const analysis::Record& record) {
+                                       progress_.onRecord(record.time);
+                                       builder.add(record);
+                                       if (text.size() < kBytesPerWrite) return;
+                                       if (written) written = output->write(text);
+                                       text.clear();
+                                     });
+    if (!written) return cannotWrite(written);
+    if (!read) return ExportFailure{ExitStatus::kNoService, read.error().message};
+    // What came after the period is not known.
+    builder.finish(request_.until && *request_.until < now()
+                       ? analysis::StreamBuilder::Finish{.now = request_.until}
+                       : streamFinish(directory_));
+    intervals_ = addNewestIntervals(trace);
+    streamCount_ = shown.streams();
+    xruns_ = shown.xruns();
+    written = output->write(text);
+    if (written) written = output->finish();
+    return cannotWrite(written);
+  }
+
+  // Adds the newest results of a trace, if they are of the time that was asked for. They belong to
+  // no application, and another store need not be that of the service whose configuration is read.
+  std::uint64_t addNewestIntervals(PerfettoTrace& trace) const {
+    if (!request_.database.empty() || !request_.applications.empty()) return 0;
+    std::ostringstream ignored;
+    const auto configuration =
+        serviceConfiguration(Complaint("export", OutputForm::kText, ignored, ignored));
+    if (std::holds_alternative<ExitStatus>(configuration)) return 0;
+    const fs::path file =
+        traceResultsFile(std::get<platform::linux_::Configuration>(configuration).storage.root);
+    std::error_code failed;
+    const auto written = std::chrono::file_clock::to_sys(fs::last_write_time(file, failed));
+    const double time = std::chrono::duration<double>(written.time_since_epoch()).count();
+    if (failed || (request_.since && time < *request_.since) ||
+        (request_.until && time >= *request_.until)) {
+      return 0;
+    }
+    const auto results = readTraceResults(file.native());
+    return results ? addIntervals(trace, *results, PerfettoTrace::timeOf(time)) : 0;
   }
 
   // Calls `handle` for each record that was asked for, until it fails.
@@ -132,15 +234,24 @@ class Export {
 
   const ExportRecords& request_;
   StoreReader& reader_;
+  const fs::path& directory_;  // of the store
   const ToolStreams& streams_;
   ExportProgress progress_;
   std::uint64_t records_ = 0;
+  std::uint64_t streamCount_ = 0;
+  std::uint64_t xruns_ = 0;
+  std::uint64_t intervals_ = 0;
 };
 
 // Returns why the file cannot be written; empty if it can, as far as that shows before the store
 // was read.
-std::string whyNot(const ExportRecords& request) {
-  if (request.to == kStandardOutput) return {};
+std::string whyNot(const ExportRecords& request, const ToolStreams& streams) {
+  if (request.to == kStandardOutput) {
+    const bool isBinary = request.format == ExportFormat::kPerfetto;
+    return isBinary && ::isatty(streams.outputDescriptor) != 0
+               ? "a trace is not text, and the standard output is a terminal; name a file with -o"
+               : std::string();
+  }
   std::error_code ignored;
   const fs::file_status status = fs::status(request.to, ignored);
   if (!fs::exists(status)) return {};
@@ -161,13 +272,14 @@ ExitStatus exportRecords(const ExportRecords& request, const CommonOptions& opti
   const auto directory = storeDirectory(request.database, complain);
   if (const auto* status = std::get_if<ExitStatus>(&directory)) return *status;
   StoreReader reader;
-  if (const auto opened = reader.open(std::get<fs::path>(directory)); !opened) {
+  const auto& path = std::get<fs::path>(directory);
+  if (const auto opened = reader.open(path); !opened) {
     return complain(ExitStatus::kNoService, opened.error().message, "no-store");
   }
-  if (const std::string reason = whyNot(request); !reason.empty()) {
+  if (const std::string reason = whyNot(request, streams); !reason.empty()) {
     return complain(ExitStatus::kBadArguments, reason);
   }
-  Export run(request, reader, streams);
+  Export run(request, reader, path, streams);
   if (const auto failure = run.run()) {
     return complain(failure->status, failure->message,
                     failure->status == ExitStatus::kNoService ? "no-store" : "");

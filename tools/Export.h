@@ -11,7 +11,7 @@
 
 namespace halvox::tools {
 
-enum class ExportFormat : std::uint8_t { kSqlite, kJsonl, kCsv, kOtlpJson };
+enum class ExportFormat : std::uint8_t { kSqlite, kJsonl, kCsv, kOtlpJson, kPerfetto };
 
 struct ExportRecords {
   ExportFormat format = ExportFormat::kSqlite;
@@ -24,9 +24,10 @@ struct ExportRecords {
   std::string database{};  // empty: as the service's configuration says
 };
 
-// Writes the stored records into a file of another form. A service may write to the store
-// meanwhile. A file gets its name when it is complete. Memory does not grow with the store. At a
-// terminal, shows on `errors` how far it has come.
+// Writes the stored records, or with ExportFormat::kPerfetto the streams that they tell of, into a
+// file of another form. A service may write to the store meanwhile. A file gets its name when it is
+// complete. Memory does not grow with the store. At a terminal, shows on `errors` how far it has
+// come.
 ExitStatus exportRecords(const ExportRecords& request, const CommonOptions& options,
                          const ToolStreams& streams);
 

@@ -346,6 +346,14 @@ class LargeStoreTest(ExportTestCase):
                 self.assertGreater(total, 2 * self.MESSAGES * self.BYTES)
                 self.assertLess(most - few, 8 << 10)
 
+    @unittest.skipIf(os.environ.get("HALVOX_SANITIZE"), "sanitizers keep freed memory")
+    def test_memory_of_a_trace_does_not_grow_with_the_store(self):
+        few, _ = self.peak("--format", "perfetto", "--until", self.early())
+        most, total = self.peak("--format", "perfetto")
+        # The messages that wait for their link message are held: at most 4,096 or 16 MiB.
+        self.assertLess(most - few, 24 << 10)
+        self.assertGreater(total, 0)
+
     def early(self):
         """A time after some two percent of the records."""
         with connect_to_store(self.service.database) as store:

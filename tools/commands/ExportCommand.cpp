@@ -17,11 +17,12 @@ using platform::linux_::Result;
 
 constexpr const char* kStandardOutput = "-";
 
-constexpr std::array<std::pair<std::string_view, ExportFormat>, 4> kFormats{
+constexpr std::array<std::pair<std::string_view, ExportFormat>, 5> kFormats{
     {{"sqlite", ExportFormat::kSqlite},
      {"jsonl", ExportFormat::kJsonl},
      {"csv", ExportFormat::kCsv},
-     {"otlp-json", ExportFormat::kOtlpJson}}};
+     {"otlp-json", ExportFormat::kOtlpJson},
+     {"perfetto", ExportFormat::kPerfetto}}};
 constexpr std::array kKinds{ExportKind::kEvents, ExportKind::kMetrics, ExportKind::kPower,
                             ExportKind::kLink, ExportKind::kSnapshots};
 
@@ -63,6 +64,11 @@ ExportRecords checked(ExportRecords request, const std::vector<ExportKind>& kind
                                "--format sqlite needs a file, such as -o records.db; the other "
                                "formats can go to the standard output");
   }
+  if (request.format == ExportFormat::kPerfetto && !kinds.empty()) {
+    throw CLI::ValidationError("--kind",
+                               "--format perfetto shows streams, not records of one kind; remove "
+                               "--kind");
+  }
   return request;
 }
 
@@ -81,7 +87,7 @@ void addExportCommand(CommandSet& commands) {
   addParsed(app, "--format", request->format, parseFormat,
             "sqlite: a database with five plain tables (default); jsonl: one JSON object a line; "
             "csv: one table for spreadsheets; otlp-json: log records of OpenTelemetry, one request "
-            "a line")
+            "a line; perfetto: a trace of the streams for Perfetto's viewer")
       ->type_name("FORMAT");
   app.add_option("-o,--output,--to", request->to,
                  "The file to write; - is the standard output (default, except for sqlite)")
