@@ -11,7 +11,7 @@
 #include "tools/Complaint.h"
 #include "tools/ServiceConfiguration.h"
 #include "tools/StoreRun.h"
-#include "tools/top/CursesView.h"
+#include "tools/top/Screen.h"
 #include "tools/top/TopSource.h"
 #include "tools/top/TopText.h"
 
@@ -80,6 +80,8 @@ void runTopScreen(const ShowTop& request, TopView& view,
   TopSnapshot snapshot;
   Clock::time_point next = Clock::now();
   std::uint64_t turns = 0;
+  // A service that has run for weeks may have a million records, which take some seconds.
+  view.draw({{"Reading what the service has stored since its start…", TopStyle::kTitle}});
   while (true) {
     if (!choice.isPaused && Clock::now() >= next) {
       if (request.count && turns == *request.count) return;
@@ -111,7 +113,7 @@ ExitStatus showTop(const ShowTop& request, const CommonOptions& options,
                         terminalWidth(streams.outputDescriptor).has_value();
   if (!isScreen) return printBatches(request, options.form(), source, streams);
   streams.output << std::flush;
-  const auto view = openCursesView();
+  const auto view = openScreen();
   if (!view) {
     complain.warn(view.error().message + "; printing batches");
     return printBatches(request, options.form(), source, streams);

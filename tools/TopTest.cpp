@@ -53,9 +53,10 @@ TEST(TopScreenTest, AKeyDrawsAtOnceAndReadsNothing) {
   runTopScreen({.interval = std::chrono::hours(1)}, view, [&](TopModel&) { ++turns; });
 
   EXPECT_EQ(turns, 1);
-  ASSERT_EQ(view.screens.size(), 3U);
-  EXPECT_THAT(view.screens[1], HasSubstr("sort: xruns, reversed"));
-  EXPECT_THAT(view.screens[2], HasSubstr("reverse the order"));
+  ASSERT_EQ(view.screens.size(), 4U);
+  EXPECT_THAT(view.screens[0], HasSubstr("Reading"));
+  EXPECT_THAT(view.screens[2], HasSubstr("sort: xruns, reversed"));
+  EXPECT_THAT(view.screens[3], HasSubstr("reverse the order"));
 }
 
 TEST(TopScreenTest, APausedScreenReadsNothing) {

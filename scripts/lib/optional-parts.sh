@@ -15,6 +15,7 @@ declare -A options=(
   [tracing]="-DHALVOX_TRACING=OFF"
   [nats]="-DHALVOX_NATS=OFF"
   [report]="-DHALVOX_REPORT=OFF"
+  [screen]="-DHALVOX_SCREEN=OFF"
 )
 options[all]="${options[*]}"
 
@@ -42,7 +43,7 @@ case "${1:-}" in
     check all halvox-reportingd halvox-sqlite halvoxctl
     ;;
   "")
-    for part in alsa pipewire trace-points tracing nats report all; do
+    for part in alsa pipewire trace-points tracing nats report screen all; do
       check "$part" all
       test_units "$part"
     done

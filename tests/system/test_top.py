@@ -5,6 +5,7 @@ import fcntl
 import json
 import os
 import pty
+import shutil
 import signal
 import struct
 import subprocess
@@ -12,7 +13,8 @@ import termios
 import unittest
 from pathlib import Path
 
-from harness import CTL, DEADLINE, OBJECT, WITH_US, Service, stop_process, wait_for
+import audio
+from harness import BIN, CTL, DEADLINE, OBJECT, WITH_US, Service, stop_process, wait_for
 
 try:
     import pyte
@@ -37,7 +39,8 @@ xruns_total{driver="demo-speakers",group="Speaker"} %d
 class Terminal:
     """A terminal with halvoxctl top on it. What it shows is in lines()."""
 
-    def __init__(self, service, *arguments, columns=80, lines=24, environment=None):
+    def __init__(self, service, *arguments, columns=80, lines=24, environment=None,
+                 program=CTL):
         self._ours, theirs = pty.openpty()
         self.screen = pyte.Screen(columns, lines)
         self._stream = pyte.ByteStream(self.screen)
@@ -45,7 +48,7 @@ class Terminal:
         self._set_size(columns, lines)
         inherited = {name: value for name, value in os.environ.items() if name != "NO_COLOR"}
         self.process = subprocess.Popen(
-            [*WITH_US, str(CTL), "top", "--interval", "100ms", *arguments],
+            [*WITH_US, str(program), "top", "--interval", "100ms", *arguments],
             stdin=theirs, stdout=theirs, stderr=subprocess.PIPE,
             env={**inherited, "TERM": "linux", "LC_ALL": "C.UTF-8",
                  "HALVOX_CONFIG": str(service.config), **(environment or {})})
@@ -139,6 +142,7 @@ class WithService(unittest.TestCase):
 
 
 @unittest.skipIf(pyte is None, "python3-pyte is not installed")
+@unittest.skipUnless((BIN / "halvoxctl-screen.so").exists(), "halvoxctl-screen.so is not in this build")
 class ScreenTest(WithService):
     def terminal(self, *arguments, **more):
         terminal = Terminal(self.service, *arguments, **more)
@@ -259,6 +263,15 @@ class ScreenTest(WithService):
             self.assertIn(b"clients", terminal.bytes)
             self.assertNotIn(b"\x1b", terminal.bytes)
 
+    def test_without_the_module_of_the_screen_there_are_batches(self):
+        program = self.service.directory / "halvoxctl"
+        shutil.copy(CTL, program)
+        terminal = self.terminal("--count", "1", program=program)
+        self.assertEqual(terminal.end(), 0)
+        self.assertRegex(terminal.process.stderr.read().decode(),
+                         "the screen needs halvoxctl-screen.so: .*; printing batches")
+        self.assertIn(b"clients", terminal.bytes)
+
     def test_a_restart_of_the_service_is_shown(self):
         terminal = self.terminal()
         self.begin(7)
@@ -343,6 +356,36 @@ class BatchTest(WithService):
         self.assertEqual(counters["connection, connections accepted"], 1)
         for name in counters:
             self.assertIn(f"counted {name}: ", self.service.log())
+
+
+@unittest.skipIf(audio.missing(), audio.missing())
+class RealAudioTest(unittest.TestCase):
+    def test_a_real_device_is_shown_with_its_clock_and_its_load(self):
+        with contextlib.ExitStack() as stack:
+            service = stack.enter_context(Service())
+            server = stack.enter_context(audio.Audio())
+            stack.enter_context(audio.Reporter(server, service))
+            stack.callback(stop_process, server.play(120))
+            top = subprocess.Popen(
+                [*WITH_US, str(CTL), "top", "--json", "--interval", "500ms"], stdin=subprocess.DEVNULL,
+                stdout=subprocess.PIPE, text=True,
+                env={**server.environment, "HALVOX_CONFIG": str(service.config)})
+            stack.callback(top.stdout.close)
+            stack.callback(stop_process, top)
+
+            def shown():
+                batch = json.loads(top.stdout.readline())
+                device = next((device for device in batch["devices"] if device["streams"]), {})
+                # The profiler reports once a second.
+                return device.get("busy") and device["quantum"] and device, batch["streams"]
+            device, streams = wait_for("the device with its stream", lambda: (
+                found := shown()) and found[0] and found[1] and found)
+
+        self.assertEqual(device["description"], "Demo speakers")
+        self.assertEqual(device["rate"], 48000)
+        self.assertTrue(16 <= device["quantum"] <= 8192, device)
+        self.assertTrue(0 < device["busy"] < 1, device)
+        self.assertEqual((streams[0]["application"], streams[0]["state"]), ("pw-play", "running"))
 
 
 class CostTest(WithService):
