@@ -20,6 +20,8 @@ using platform::Message;
 // the vocabulary's tables do not list them. Their texts are "Undefined" and "Unknown".
 constexpr AudioEventCategory kSummaryCategory{0xFFFFFFFF};
 constexpr AudioEventType kSummaryType = AudioEventType::kUnknown;
+// Messages in a summary that takes about a millisecond. Other clients may wait as long as that.
+constexpr std::size_t kMostInShortSummary = 2000;
 
 Dictionary taggedMessage(const Message& message, AudioEventCategory category, AudioEventType type) {
   return HVReportingUtilityAddAudioMessageTag(
@@ -32,7 +34,10 @@ LateContent contentOf(const std::shared_ptr<const LateSummary>& summary) {
     Dictionary tagged = taggedMessage(event, kSummaryCategory, kSummaryType);
     return {.original = std::move(event), .tagged = std::move(tagged)};
   };
-  return {.make = make, .memorySize = summary->memorySize()};
+  return {.make = make,
+          .memorySize = summary->memorySize(),
+          .length = summary->size() > kMostInShortSummary ? LateContent::Length::kLong
+                                                          : LateContent::Length::kShort};
 }
 
 }  // namespace
@@ -128,11 +133,13 @@ void HVReportingSession::sendVolumeMessages() {
 // Sends the summary event through the session only. Unlike a volume message, the event does not go
 // to the analytics service; this is required.
 //
-// This does what sendMessage() does, with two differences that nobody can observe. The job of the
-// link makes the content of the event, because for a history of millions of messages that takes
-// seconds, in which all clients would wait. The event is not added to the history, which nothing
-// reads from here on and which is empty until the end of the stop. The event never repeats a
-// message of the history: it has a text that is longer than that of any message with the same keys.
+// This does what sendMessage() does, with two differences. The job of the link makes the content of
+// a long event, because for a history of millions of messages that takes seconds, in which all
+// clients would wait. A short event is sent at once if possible: otherwise, the first events of the
+// session's next run would be stored before the summary of this one. The event is not added to the
+// history, which nothing reads from here on and which is empty until the end of the stop. The event
+// never repeats a message of the history: it has a text that is longer than that of any message
+// with the same keys. It counts as recorded even if the disk is full, because it needs no room.
 void HVReportingSession::sendSummaryEvent() {
   const auto summary = summary_.takeHistory();
   if (summary == nullptr) return;
@@ -141,11 +148,13 @@ void HVReportingSession::sendSummaryEvent() {
   count(SessionHistory::Outcome::kRecorded);
   emitTracePoint(ReportingTracePoint::kMessageSent);
   if (!tlmReportingEnabled()) return;
-  link_.submit(shared_from_this(), {.late = contentOf(summary),
-                                    .category = kSummaryCategory,
-                                    .type = kSummaryType,
-                                    .wasStarted = started(),
-                                    .sender = held_.account()});
+  LinkMessage event{.late = contentOf(summary),
+                    .category = kSummaryCategory,
+                    .type = kSummaryType,
+                    .wasStarted = started(),
+                    .sender = held_.account()};
+  const bool isShort = event.late->length == LateContent::Length::kShort;
+  if (!isShort || !link_.trySend(event)) link_.submit(shared_from_this(), std::move(event));
 }
 
 std::vector<Dictionary> HVReportingSession::createVolumeMessages(const MessageHistory& history,

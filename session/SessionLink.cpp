@@ -16,7 +16,6 @@
 namespace halvox {
 namespace {
 
-using platform::Dictionary;
 using platform::JobWeight;
 using platform::WaitOutcome;
 
@@ -42,6 +41,19 @@ std::size_t bytesOf(const LinkMessage& message) {
   // 128 bytes are in both.
   if (tagged.sharedEntries(*original) < original->size()) bytes += original->memorySize();
   return bytes;
+}
+
+// A semaphore that has one signal while no long content is being made. It exists while somebody
+// holds it, and then belongs to the dispatch service of its holders.
+std::shared_ptr<platform::DispatchSemaphore> turnOfLongContents() {
+  static Guarded<std::weak_ptr<platform::DispatchSemaphore>> current;
+  const auto locked = current.lock();
+  auto turn = locked->lock();
+  if (turn == nullptr) {
+    turn = platform::dispatch().createSemaphore(1);
+    *locked = turn;
+  }
+  return turn;
 }
 
 void logBackends(const LinkDiscovery::Backends& backends) {
@@ -166,9 +178,26 @@ void SessionLink::endStop() {
 void SessionLink::submit(const Owner& owner, LinkMessage message) {
   counters_.link.received.add();
   ResourceCharge charge(message.sender, message.sender == nullptr ? 0 : bytesOf(message));
-  tlmReportingQueue()->async(
-      JobWeight::kMayBlock,
-      [this, owner, message = std::move(message), charge = std::move(charge)] { handle(message); });
+  tlmReportingQueue()->async(JobWeight::kMayBlock, [this, owner, message = std::move(message),
+                                                    charge = std::move(charge)] {
+    const bool isLong =
+        message.late.has_value() && message.late->length == LateContent::Length::kLong;
+    isLong ? handleInTurn(owner, message, charge) : handle(message);
+  });
+}
+
+// Without turns, two long summaries would hold both threads of the pool, on which the timer of all
+// delayed jobs runs, and would take twice the memory. The queue waits for its turn without a
+// thread.
+void SessionLink::handleInTurn(const Owner& owner, const LinkMessage& message,
+                               const ResourceCharge& charge) {
+  auto turn = turnOfLongContents();
+  tlmReportingQueue()->waitOn(
+      turn, std::nullopt, [this, owner, message, charge, turn](WaitOutcome /*outcome*/) {
+        // Also ends the turn if making the content throws.
+        const std::shared_ptr<void> end(nullptr, [&turn](void*) { turn->signal(); });
+        handle(message);
+      });
 }
 
 bool SessionLink::trySend(const LinkMessage& message) {

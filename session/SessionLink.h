@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <cstddef>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -29,8 +30,13 @@ struct LinkContent {
 
 // The content of a message that is made only when the message is sent, if it is sent.
 struct LateContent {
+  // Long: `make` takes more than a millisecond, and much memory. In the whole process, one such
+  // content at a time is made and sent.
+  enum class Length : std::uint8_t { kShort, kLong };
+
   std::function<LinkContent()> make;
   std::size_t memorySize = 0;  // of what `make` keeps until then, in bytes
+  Length length = Length::kShort;
 };
 
 // A message on its way to the link.
@@ -80,7 +86,7 @@ class SessionLink {
   // queue and the framework only notes messages. Otherwise does nothing and returns false; the
   // caller then calls submit(). The order of messages stays the same. As a job of the pool, a
   // message takes 1,865 instructions instead of 450 even without a link. When messages are rare,
-  // the job also costs another change of threads.
+  // the job also costs another change of threads. The message must not have a long late content.
   [[nodiscard]] bool trySend(const LinkMessage& message);
   // Flushes what the framework still holds and closes the link.
   void submitStop(const Owner& owner);
@@ -117,6 +123,7 @@ class SessionLink {
   // Forgets the framework's session; the link sends nothing from then on.
   void drop();
   void handle(const LinkMessage& message);
+  void handleInTurn(const Owner& owner, const LinkMessage& message, const ResourceCharge& charge);
   void sendThroughFramework(const LinkMessage& message);
   void sendContent(const platform::TLMReportingService::Session& open, const LinkMessage& message,
                    const LinkContent& content);

@@ -24,6 +24,8 @@ class LateSummary {
 
   // Takes time, and memory for the texts, in proportion to the history. Logs what it cannot read.
   [[nodiscard]] platform::Dictionary makeEvent() const;
+  // The number of its messages.
+  [[nodiscard]] std::size_t size() const { return history_.size(); }
   // What it keeps in memory.
   [[nodiscard]] std::size_t memorySize() const { return history_.memorySize(); }
 

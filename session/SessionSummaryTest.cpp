@@ -294,6 +294,70 @@ TEST_F(SessionSummaryTest, TheLinksJobMakesTheEventAndReleasesTheHistory) {
   EXPECT_EQ(std::ranges::count(summary.find("foo")->string(), ','), kLongMessages - 1);
 }
 
+TEST_F(SessionSummaryTest, AShortSummaryIsSentBeforeTheStopReturns) {
+  platform_.dispatch.letThreadsEnter();
+  platform_.tlmReporting.setOnlyNotesMessages(true);
+  restartWithLink(platform::Array{"server"});
+  platform_.dispatch.runUntilIdle();
+  for (int number = 0; number < 2000; ++number) send({{"foo", number}});
+
+  session_->stop();
+
+  const Dictionary summary = platform_.tlmReporting.messages().back().payload;
+  ASSERT_TRUE(summary.contains("HV_Session_Summary_Event"));
+  EXPECT_EQ(std::ranges::count(summary.find("foo")->string(), ','), 1999);
+}
+
+TEST_F(SessionSummaryTest, ALongSummaryIsNotMadeDuringTheStop) {
+  platform_.dispatch.letThreadsEnter();
+  platform_.tlmReporting.setOnlyNotesMessages(true);
+  restartWithLink(platform::Array{"server"});
+  platform_.dispatch.runUntilIdle();
+  for (int number = 0; number < 2001; ++number) send({{"foo", number}});
+
+  session_->stop();
+  EXPECT_EQ(platform_.tlmReporting.messages().size(), 2001U);
+  platform_.dispatch.runUntilIdle();
+
+  EXPECT_EQ(platform_.tlmReporting.messages().size(), 2002U);
+}
+
+TEST_F(SessionSummaryTest, OneLongSummaryAtATimeIsMade) {
+  restartWithLink(platform::Array{"server"});
+  for (int number = 0; number < 2001; ++number) send({{"foo", number}});
+  const auto first = session_;
+  session_ = std::make_shared<HVReportingSession>(ReporterID{8},
+                                                  HVReportingSession::ProcessIdentifiers{12},
+                                                  SessionCounters::make(platform_.statistics));
+  restartWithLink(platform::Array{"server"});
+  for (int number = 0; number < 2001; ++number) send({{"foo", number}});
+  platform_.dispatch.runUntilIdle();
+  const std::size_t before = platform_.tlmReporting.messages().size();
+  // When the first summary is about to be made, all other jobs that can run do so.
+  const auto other = platform_.dispatch.createSerialQueue(
+      "other", platform::QualityOfService::kUtility, platform::QueueThreading::kShared);
+  int begun = 0;
+  int begunMeanwhile = 0;
+  platform_.journal.whenRecorded([&](const platform::JournalEntry& entry) {
+    const bool isSending = entry.text.find("-[HVReportingSession sendMessage") != std::string::npos;
+    if (!isSending || ++begun > 1) return;
+    const auto done = platform_.dispatch.createSemaphore(0);
+    other->async(platform::JobWeight::kBrief, [done] { done->signal(); });
+    done->wait();
+    begunMeanwhile = begun - 1;
+  });
+
+  first->stop();
+  session_->stop();
+  platform_.dispatch.runUntilIdle();
+  platform_.journal.whenRecorded(nullptr);
+
+  EXPECT_EQ(begunMeanwhile, 0);
+  EXPECT_EQ(begun, 2);
+  EXPECT_EQ(platform_.dispatch.waitingQueues(), 0U);
+  EXPECT_EQ(platform_.tlmReporting.messages().size(), before + 2);
+}
+
 TEST_F(SessionSummaryTest, ARunThatBeginsMeanwhileHasNoPartInTheEvent) {
   restartWithLink(platform::Array{"server"});
   send({{"foo", 1}});
