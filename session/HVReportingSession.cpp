@@ -102,23 +102,42 @@ void HVReportingSession::start() {
   tracing_.start(shared_from_this());
 }
 
-// A started session logs the first line twice. This is required: tools match both.
 void HVReportingSession::stop() {
+  const auto rest = beginStop();
+  if (rest == nullptr) return;
+  while (!rest->writePart()) {
+  }
+  rest->finish();
+}
+
+// A started session logs the first line twice. This is required: tools match both.
+std::unique_ptr<SessionStop> HVReportingSession::beginStop() {
   kSessionLog.debug("ending session ", number(reporterID()));
-  if (!started()) return;
+  if (!started()) return nullptr;
   kSessionLog.debug("ending session ", number(reporterID()));
   emitTracePoint(ReportingTracePoint::kSessionStopped);
   // This order is required. The volume messages become part of the history first, because the file
   // and the summary event contain them. The file does not contain the summary event.
   sendVolumeMessages();
-  summary_.writeFile();
-  sendSummaryEvent();
-  // Queued after the messages above, which must reach the link before its flush.
-  if (tlmReportingEnabled()) link_.submitStop(shared_from_this());
-  tracing_.stop();
+  const auto run = summary_.takeHistory();
+  auto file = run == nullptr ? nullptr : summary_.makeFile(run);
+  if (file == nullptr) endStop(run);
   static_cast<void>(history_.end());
   // Cleared last, because the messages that this stop sends count as messages of a started session.
+  // If the file remains, other clients must find a stopped session from here on: a message of
+  // theirs can be neither in the file nor in the event.
   started_.store(false, std::memory_order_release);
+  if (file == nullptr) return nullptr;
+  // The history is no longer part of the session's tally.
+  ResourceCharge charge(held_.account(), run->memorySize());
+  return std::make_unique<SessionStop>(shared_from_this(), run, std::move(file), std::move(charge));
+}
+
+void HVReportingSession::endStop(const std::shared_ptr<const LateSummary>& run) {
+  if (run != nullptr) sendSummaryEvent(run);
+  // Queued after the messages of the run, which must reach the link before its flush.
+  if (tlmReportingEnabled()) link_.submitStop(shared_from_this());
+  tracing_.stop();
 }
 
 // Each volume message goes through the session, which records it, and to the analytics service.
@@ -140,18 +159,16 @@ void HVReportingSession::sendVolumeMessages() {
 // history, which nothing reads from here on and which is empty until the end of the stop. The event
 // never repeats a message of the history: it has a text that is longer than that of any message
 // with the same keys. It counts as recorded even if the disk is full, because it needs no room.
-void HVReportingSession::sendSummaryEvent() {
-  const auto summary = summary_.takeHistory();
-  if (summary == nullptr) return;
+void HVReportingSession::sendSummaryEvent(const std::shared_ptr<const LateSummary>& run) {
   kSessionLog.notice("sending summary event for reporter ", number(reporterID()));
   kSessionLog.debug("sending message for session owned by ", number(reporterID()));
   count(SessionHistory::Outcome::kRecorded);
   emitTracePoint(ReportingTracePoint::kMessageSent);
   if (!tlmReportingEnabled()) return;
-  LinkMessage event{.late = contentOf(summary),
+  LinkMessage event{.late = contentOf(run),
                     .category = kSummaryCategory,
                     .type = kSummaryType,
-                    .wasStarted = started(),
+                    .wasStarted = true,
                     .sender = held_.account()};
   const bool isShort = event.late->length == LateContent::Length::kShort;
   if (!isShort || !link_.trySend(event)) link_.submit(shared_from_this(), std::move(event));

@@ -13,6 +13,7 @@
 #include "session/SessionHistory.h"
 #include "session/SessionLink.h"
 #include "session/SessionProfile.h"
+#include "session/SessionStop.h"
 #include "session/SessionSummary.h"
 #include "session/SessionTracing.h"
 
@@ -124,6 +125,9 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   // started. Takes time in proportion to the history. Waits for the disk on internal builds, and
   // for the trace of a test session without a time-out.
   void stop();
+  // Does the same, but leaves a summary file and what must follow it to the caller. The session is
+  // stopped when this returns. Returns null if nothing remains.
+  [[nodiscard]] std::unique_ptr<SessionStop> beginStop();
 
   // How long the client played at which volume: one message for each interval longer than
   // `minimumPlaytime` seconds, in the order in which the intervals ended.
@@ -167,8 +171,12 @@ class HVReportingSession : public std::enable_shared_from_this<HVReportingSessio
   }
 
  private:
+  friend class SessionStop;
+
   void sendVolumeMessages();
-  void sendSummaryEvent();
+  void sendSummaryEvent(const std::shared_ptr<const LateSummary>& run);
+  // The end of a stop, after the file. `run` is null if the history was empty.
+  void endStop(const std::shared_ptr<const LateSummary>& run);
   void count(SessionHistory::Outcome outcome) const;
 
   // Members that others refer to come first, because destruction runs backwards.

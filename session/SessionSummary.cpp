@@ -25,6 +25,9 @@ constexpr std::string_view kDirectory =
 // The readers of these files expect these permissions. Other users are kept out by the permissions
 // of the storage root.
 constexpr std::uint32_t kDirectoryPermissions = 0777;
+// A part should end soon, because the files of several stops take turns, and because an orderly end
+// of the service measures its progress in parts.
+constexpr int kMessagesInPart = 10'000;
 
 void logIfCutShort(const MessageHistory::Reader& reader, ReporterID reporterID) {
   if (!reader.error().has_value()) return;
@@ -39,6 +42,40 @@ platform::Dictionary makeEventOf(const MessageHistory& history, AudioServiceType
   while (const MessageHistory::Entry* entry = reader.next()) event.add(*entry);
   logIfCutShort(reader, reporterID);
   return event.take();
+}
+
+// The text is written piece by piece, because a long history and its whole text may not fit into
+// memory together. The directory must therefore exist before the text is made. Every value has a
+// JSON text: only the file can fail.
+std::unique_ptr<platform::JsonArrayFile> beginFile(const std::string& name) {
+  platform::FileService& files = platform::files();
+  // Creating the file is tried even if this fails, and the failure of the file is logged as well.
+  // Both lines are required.
+  if (const auto error = files.createDirectory(kDirectory, kDirectoryPermissions)) {
+    kSessionLog.error("can't create logging directory at ", kDirectory, ": ", error->description);
+  }
+  return files.createJsonArrayFile(kDirectory, name);
+}
+
+// Writes the next messages of a part. Returns true at the end of the history.
+bool writeNext(MessageHistory::Reader& reader, platform::JsonArrayFile& file) {
+  for (int count = 0; count < kMessagesInPart; ++count) {
+    const MessageHistory::Entry* const entry = reader.next();
+    if (entry == nullptr) return true;
+    file.appendObject(entry->identifier(), entry->message());
+  }
+  return false;
+}
+
+void endFile(const MessageHistory::Reader& reader, platform::JsonArrayFile& file,
+             ReporterID reporterID) {
+  logIfCutShort(reader, reporterID);
+  std::string path;
+  if (const auto error = file.commit(path)) {
+    kSessionLog.error("jsonOutput writeToURL: ", error->description);
+  } else {
+    kSessionLog.info("jsonOutput writeToURL: ", path);
+  }
 }
 
 }  // namespace
@@ -74,35 +111,35 @@ std::shared_ptr<const LateSummary> SessionSummary::takeHistory() const {
                                              std::move(*history));
 }
 
-// Writes the text piece by piece, because a long history and its whole text may not fit into memory
-// together. The directory must therefore exist before the text is made. Every value has a JSON
-// text: only the file can fail.
 void SessionSummary::writeFile() const {
   if (!HVReportingUtilityIsInternalBuild() || history_.size() == 0) return;
-  platform::FileService& files = platform::files();
-  // Creating the file is tried even if this fails, and the failure of the file is logged as well.
-  // Both lines are required.
-  if (const auto error = files.createDirectory(kDirectory, kDirectoryPermissions)) {
-    kSessionLog.error("can't create logging directory at ", kDirectory, ": ", error->description);
+  const auto file = beginFile(fileName());
+  // The lock is held until the whole history has been written, because the file shows one moment of
+  // the history.
+  const SessionHistory::Lock history = history_.lock();
+  if (!history->has_value()) return;
+  MessageHistory::Reader reader(**history);
+  while (!writeNext(reader, *file)) {
   }
-  const auto file = files.createJsonArrayFile(kDirectory, fileName());
-  {
-    // The lock is held until the whole history has been written, because the file shows one moment
-    // of the history.
-    const SessionHistory::Lock history = history_.lock();
-    if (!history->has_value()) return;
-    MessageHistory::Reader reader(**history);
-    while (const MessageHistory::Entry* entry = reader.next()) {
-      file->appendObject(entry->identifier(), entry->message());
-    }
-    logIfCutShort(reader, profile_.reporterID());
-  }
-  std::string path;
-  if (const auto error = file->commit(path)) {
-    kSessionLog.error("jsonOutput writeToURL: ", error->description);
-  } else {
-    kSessionLog.info("jsonOutput writeToURL: ", path);
-  }
+  endFile(reader, *file, profile_.reporterID());
+}
+
+std::unique_ptr<SummaryFile> SessionSummary::makeFile(
+    const std::shared_ptr<const LateSummary>& run) const {
+  if (!HVReportingUtilityIsInternalBuild()) return nullptr;
+  return std::make_unique<SummaryFile>(run, fileName());
+}
+
+SummaryFile::SummaryFile(std::shared_ptr<const LateSummary> run, std::string name)
+    : run_(std::move(run)), name_(std::move(name)), reader_(run_->history()) {}
+
+SummaryFile::~SummaryFile() = default;
+
+bool SummaryFile::writePart() {
+  if (file_ == nullptr) file_ = beginFile(name_);
+  if (!writeNext(reader_, *file_)) return false;
+  endFile(reader_, *file_, run_->reporterID());
+  return true;
 }
 
 std::string SessionSummary::fileName() const {

@@ -122,9 +122,46 @@ TEST_F(SessionSummaryFileTest, ItsPathIsLoggedAtInfoLevel) {
   EXPECT_EQ(lines[0].category, "hvrr");
 }
 
-TEST_F(SessionSummaryFileTest, AnEmptyHistoryWritesNoFile) {
+TEST_F(SessionSummaryFileTest, TheCallerOfAStopMayWriteTheFileLater) {
+  send({{"foo", 1}});
+  platform_.log.clear();
+
+  const auto rest = session_->beginStop();
+  ASSERT_NE(rest, nullptr);
+  EXPECT_FALSE(session_->started());
+  send({{"foo", 2}});  // not of the run any more
+  EXPECT_TRUE(rest->writePart());
+
+  EXPECT_THAT(keys(), ElementsAre("Playback_Start_1"));
+  EXPECT_FALSE(platform_.log.containsText("sending summary event for reporter 7"));
+  rest->finish();
+  EXPECT_TRUE(platform_.log.containsText("sending summary event for reporter 7"));
+}
+
+TEST_F(SessionSummaryFileTest, AStopThatIsDroppedBeforeItsEndLeavesNoFile) {
+  for (int number = 0; number < 15'000; ++number) send({{"foo", number}});
+
+  auto rest = session_->beginStop();
+  ASSERT_NE(rest, nullptr);
+  EXPECT_FALSE(rest->writePart());
+  rest.reset();
+
+  EXPECT_THAT(platform_.files.files(), testing::IsEmpty());
+}
+
+TEST_F(SessionSummaryFileTest, AFileOfSeveralPartsHoldsTheWholeHistory) {
+  for (int number = 0; number < 25'000; ++number) send({{"foo", number}});
+
   session_->stop();
 
+  ASSERT_EQ(keys().size(), 25'000U);
+  EXPECT_EQ(keys().back(), "Playback_Start_25000");
+}
+
+TEST_F(SessionSummaryFileTest, AnEmptyHistoryWritesNoFile) {
+  EXPECT_EQ(session_->beginStop(), nullptr);
+
+  EXPECT_FALSE(session_->started());
   EXPECT_THAT(platform_.files.steps(), testing::IsEmpty());
 }
 
