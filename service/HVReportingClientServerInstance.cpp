@@ -83,6 +83,20 @@ HVReportingClientServerInstance::Session HVReportingClientServerInstance::findRe
   return delegate == nullptr ? nullptr : delegate->findReportingSessionForID(reporterID);
 }
 
+template <typename Work>
+struct HVReportingClientServerInstance::RequestJob {
+  std::shared_ptr<HVReportingClientServerInstance> client;
+  platform::RequestToken token;
+  Work work;
+
+  void operator()() {
+    HVReportingClientServerInstance& target = *client;
+    if (target.isStopping_) return target.postpone(std::move(*this));
+    work(target);
+    target.counters_->requests.carriedOut.add();
+  }
+};
+
 // The job holds the client, so that the requests of a connection that has ended are still carried
 // out. It also holds the request's token, by which the connection knows how many of its requests
 // are open. A request with a dictionary charges the dictionary to its client before it is queued.
@@ -95,11 +109,8 @@ void HVReportingClientServerInstance::queueRequest(platform::JobWeight weight,
   // the order of their arrival.
   endOfRequests();
   counters_->requests.received.add();
-  reportingQueue()->async(weight, [client = shared_from_this(), token = std::move(context.token),
-                                   work = std::move(work)]() mutable {
-    work(*client);
-    client->counters_->requests.carriedOut.add();
-  });
+  reportingQueue()->async(
+      weight, RequestJob<Work>{shared_from_this(), std::move(context.token), std::move(work)});
 }
 
 // The I/O thread may run the brief requests itself. Starts, stops and destroys are not brief: they
@@ -206,6 +217,12 @@ void HVReportingClientServerInstance::endOfRequests() {
 }
 
 void HVReportingClientServerInstance::carryOutSends(Messages& messages) {
+  if (isStopping_) {
+    return postpone([client = shared_from_this(),
+                     kept = std::make_shared<Messages>(std::exchange(messages, {}))] {
+      client->carryOutSends(*kept);
+    });
+  }
   std::exception_ptr failure;
   for (MessageRequest& message : messages) {
     // Moved out of the list, so that the request is released as soon as its message is sent. The

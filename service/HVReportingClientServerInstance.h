@@ -1,6 +1,7 @@
 #pragma once
 
 #include <cstdint>
+#include <deque>
 #include <memory>
 #include <optional>
 #include <string>
@@ -24,9 +25,11 @@ namespace halvox {
 // but change only its own.
 //
 // Requests arrive on the connection's thread, which only queues them. The work runs on the
-// reporting queue, which also owns the map of sessions. Shared by its connection, by the delegate
-// while it is registered, and by its queued requests: it is always held by a shared pointer. No
-// operation fails: a request about an unknown session is answered without an error.
+// reporting queue, which also owns the map of sessions. While the summary file of a stop is being
+// written elsewhere, the client's next requests wait, and other clients do not. Shared by its
+// connection, by the delegate while it is registered, and by its queued requests: it is always held
+// by a shared pointer. No operation fails: a request about an unknown session is answered without
+// an error.
 class HVReportingClientServerInstance final
     : public HVReportingServiceProtocol,
       public std::enable_shared_from_this<HVReportingClientServerInstance> {
@@ -108,6 +111,9 @@ class HVReportingClientServerInstance final
   // that once sent much must not keep memory for ever.
   static Guarded<std::vector<Messages>>& spareMessages();
 
+  // The queued work of a request.
+  template <typename Work>
+  struct RequestJob;
   // Queues `work`, which is called with this client, on the reporting queue. Keeps the client and
   // the request's token until then.
   template <typename Work>
@@ -133,10 +139,17 @@ class HVReportingClientServerInstance final
   void carryOutGetAllReporters(const ReportersReply& reply) const;
   void carryOutConnectionError();
 
+  // Stops a started session. Returns true if the stop is complete. Otherwise the session is stopped
+  // for all other clients, but its summary file is still being written. This client's requests wait
+  // until the file is complete and `finished` has run, on the reporting queue.
+  [[nodiscard]] bool stop(const Session& session, platform::Job finished);
+  void finishStop(SessionStop& rest, const platform::Job& finished);
+  // Keeps the job until the client's stop is complete.
+  void postpone(platform::Job job);
+  void carryOutPostponed();
+
   // Starts a session that is not started, and holds `reply` back until its stop.
   void begin(const Session& session, const Delegate& delegate, const BoolReply& reply);
-  // Reports on and stops a started session, and delivers its held reply.
-  void end(const Session& session, const Delegate& delegate);
   // The three ways of a message: to the sessions that it names, to all started sessions if it names
   // none, and to no session if none is started.
   void sendToNamedSessions(const MessageRequest& request, const Delegate& delegate) const;
@@ -158,8 +171,11 @@ class HVReportingClientServerInstance final
   const std::shared_ptr<ResourceAccount> account_ = std::make_shared<ResourceAccount>();
   Guarded<std::optional<platform::Date>> clientStartDate_;
   Guarded<std::optional<std::string>> clientProcessName_;
-  SessionMap sessions_;  // reporting queue only
-  Messages posted_;      // connection's thread only; not queued yet
+  // Reporting queue only.
+  SessionMap sessions_;
+  bool isStopping_ = false;              // a summary file of this client is being written
+  std::deque<platform::Job> postponed_;  // its requests and clean-up meanwhile; hold this client
+  Messages posted_;                      // connection's thread only; not queued yet
 };
 
 }  // namespace halvox

@@ -1,12 +1,96 @@
 #include <algorithm>
+#include <exception>
+#include <string_view>
 #include <utility>
 
+#include "platform/dispatch.h"
+#include "platform/services.h"
 #include "service/HVReportingClientServerInstance.h"
 #include "service/ReportingQueue.h"
 #include "service/ServiceLog.h"
 
-// How sessions enter and leave a client, and how a client leaves the service.
+// How sessions enter and leave a client, how a stop waits for its summary file, and how a client
+// leaves the service.
 namespace halvox {
+namespace {
+
+constexpr std::string_view kFileQueueLabel = "com.tarno.halvox.reporting.summaryfile";
+
+// Writes the file part by part, then queues `then` on the reporting queue. Each part is a job, so
+// that an orderly end of the service can see the progress.
+void writeParts(const std::shared_ptr<platform::DispatchQueue>& queue,
+                const std::shared_ptr<SessionStop>& rest, const platform::Job& then) {
+  queue->async(platform::JobWeight::kMayBlock, [queue, rest, then] {
+    bool isComplete = true;
+    std::exception_ptr failure;
+    try {
+      isComplete = rest->writePart();
+    } catch (...) {
+      // The queue logs the exception. The client's requests must not wait for ever.
+      failure = std::current_exception();
+    }
+    if (!isComplete) return writeParts(queue, rest, then);
+    reportingQueue()->async(platform::JobWeight::kMayBlock, then);
+    if (failure) std::rethrow_exception(failure);
+  });
+}
+
+}  // namespace
+
+// Clients rely on the file after the answer, and the file precedes the summary event. The client
+// that stops therefore waits for the file, with everything that it sends meanwhile. Other clients
+// do not wait: for them the session is stopped when this returns, as if the whole stop had been
+// carried out now. They cannot see how long a stop takes: the file, the event and the replies have
+// no order with what other clients do.
+//
+// The queue has the quality of requests, because a request waits for it. Each stop has a queue of
+// its own: the pool has two threads, and the files of further stops take turns.
+bool HVReportingClientServerInstance::stop(const Session& session, platform::Job finished) {
+  const std::shared_ptr<SessionStop> rest = session->beginStop();
+  if (rest == nullptr) return true;
+  isStopping_ = true;
+  const auto queue = platform::dispatch().createSerialQueue(
+      kFileQueueLabel, platform::QualityOfService::kUserInteractive,
+      platform::QueueThreading::kShared);
+  writeParts(queue, rest, [client = shared_from_this(), rest, finished = std::move(finished)] {
+    client->finishStop(*rest, finished);
+  });
+  return false;
+}
+
+void HVReportingClientServerInstance::finishStop(SessionStop& rest, const platform::Job& finished) {
+  std::exception_ptr failure;
+  try {
+    rest.finish();
+    isStopping_ = false;
+    finished();  // may begin the next stop
+  } catch (...) {
+    isStopping_ = false;
+    failure = std::current_exception();
+  }
+  carryOutPostponed();
+  if (failure) std::rethrow_exception(failure);
+}
+
+void HVReportingClientServerInstance::postpone(platform::Job job) {
+  postponed_.push_back(std::move(job));
+}
+
+// The connection bounds the number of these jobs, because each holds a request open.
+void HVReportingClientServerInstance::carryOutPostponed() {
+  std::exception_ptr failure;
+  while (!isStopping_ && !postponed_.empty()) {
+    const platform::Job job = std::move(postponed_.front());
+    postponed_.pop_front();
+    try {
+      job();
+    } catch (...) {
+      // The queue logs the exception. The other requests are still carried out.
+      failure = std::current_exception();
+    }
+  }
+  if (failure) std::rethrow_exception(failure);
+}
 
 void HVReportingClientServerInstance::putSession(const Session& session, const Delegate& delegate) {
   session->chargeTo(account_);
@@ -39,6 +123,9 @@ void HVReportingClientServerInstance::handleConnectionError() {
 }
 
 void HVReportingClientServerInstance::carryOutConnectionError() {
+  if (isStopping_) {
+    return postpone([client = shared_from_this()] { client->carryOutConnectionError(); });
+  }
   const Delegate delegate = delegate_.lock();
   if (delegate == nullptr) return;
   // An interruption and the end of the connection both lead here. The second call finds the client
@@ -48,7 +135,9 @@ void HVReportingClientServerInstance::carryOutConnectionError() {
   // As for a destroyed session, the counter of active sessions does not change and held replies are
   // dropped. Both are required.
   for (const auto& [reporterID, session] : sessions_) {
-    if (session->started()) session->stop();
+    if (!session->started() || stop(session, [this] { carryOutConnectionError(); })) continue;
+    note(session, SessionChange::kStopped, delegate);
+    return;  // called again when the stop is complete
   }
   // Sessions are removed only after all of them have been stopped; this order is required.
   while (!sessions_.empty()) removeSession(sessions_.begin(), delegate);

@@ -148,22 +148,26 @@ void HVReportingClientServerInstance::carryOutStop(ReporterID reporterID, const 
     reply(std::nullopt, true);
     return;
   }
+  const auto answer = [reporterID, reply] {
+    kServiceLog.notice("stopping ", number(reporterID));
+    reply(std::nullopt, true);
+  };
   const Session session = findReportingSessionForID(reporterID, Lookup::kOwnSessions);
-  if (session != nullptr && session->started()) end(session, delegate_.lock());
-  kServiceLog.notice("stopping ", number(reporterID));
-  reply(std::nullopt, true);
-}
-
-void HVReportingClientServerInstance::end(const Session& session, const Delegate& delegate) {
+  if (session == nullptr || !session->started()) return answer();
+  const Delegate delegate = delegate_.lock();
   // The driver messages come first, because only a started session records and forwards them. The
   // snapshot is not needed after them. The held reply of the start precedes the reply to this stop.
   if (delegate != nullptr) delegate->sendDriverLogsForSession(session);
   session->setDriverSnapShot(std::nullopt);
-  session->stop();
+  const auto finished = [this, session, answer] {
+    deliverHeldReply(*session, *counters_);
+    logActiveSessions(delegate_.lock());
+    answer();
+  };
+  const bool isComplete = stop(session, finished);
   note(session, SessionChange::kStopped, delegate);
   addToActiveSessionCount(delegate, -1);
-  deliverHeldReply(*session, *counters_);
-  logActiveSessions(delegate);
+  if (isComplete) finished();
 }
 
 void HVReportingClientServerInstance::carryOutDestroy(ReporterID reporterID,
@@ -176,12 +180,17 @@ void HVReportingClientServerInstance::carryOutDestroy(ReporterID reporterID,
   }
   // Unlike a stop, this sends no driver logs, does not change the counter of active sessions, and
   // drops the held reply of the start. All three are required.
-  if (const auto own = sessions_.find(reporterID); own != sessions_.end()) {
-    if (own->second->started()) own->second->stop();
-    removeSession(own, delegate_.lock());
-  }
-  kServiceLog.notice("destroying ", number(reporterID));
-  reply(std::nullopt, true);
+  const auto finished = [this, reporterID, reply] {
+    const auto own = sessions_.find(reporterID);
+    if (own != sessions_.end()) removeSession(own, delegate_.lock());
+    kServiceLog.notice("destroying ", number(reporterID));
+    reply(std::nullopt, true);
+  };
+  Session session = findReportingSessionForID(reporterID, Lookup::kOwnSessions);
+  const bool isComplete = session == nullptr || !session->started() || stop(session, finished);
+  if (!isComplete) return note(session, SessionChange::kStopped, delegate_.lock());
+  session.reset();  // the map has the last reference
+  finished();
 }
 
 void HVReportingClientServerInstance::carryOutReporterIDValid(ReporterID reporterID,
