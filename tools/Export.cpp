@@ -152,14 +152,15 @@ class Export {
     Result<void> written;
     analysis::StoreRecordSource source(reader_);
     // All messages: a stream that ran in the time that was asked for may have begun long before it.
-    const auto read = source.forEach({.since = std::nullopt, .until = request_.until},
-                                     [&](const analysis::Record& record) {
-                                       progress_.onRecord(record.time);
-                                       builder.add(record);
-                                       if (text.size() < kBytesPerWrite) return;
-                                       if (written) written = output->write(text);
-                                       text.clear();
-                                     });
+    const auto onRecord = [&](const analysis::Record& record) {
+      progress_.onRecord(record.time);
+      builder.add(record);
+      if (text.size() < kBytesPerWrite) return;
+      written = output->write(text);
+      text.clear();
+      if (!written) reader_.stopReading();
+    };
+    const auto read = source.forEach({.since = std::nullopt, .until = request_.until}, onRecord);
     if (!written) return cannotWrite(written);
     if (!read) return ExportFailure{ExitStatus::kNoService, read.error().message};
     // What came after the period is not known.
@@ -205,9 +206,10 @@ class Export {
           progress_.onRecord(item.time);
           // Every record: link messages are known by the events before them.
           const bool isWanted = applications.accepts(item) && request_.kinds.has(kindOf(item));
-          if (!handled || !isWanted) return;
+          if (!isWanted) return;
           handled = handle(item);
           ++records_;
+          if (!handled) reader_.stopReading();
         });
     if (!handled) return cannotWrite(handled);
     if (!read) return ExportFailure{ExitStatus::kNoService, read.error().message};

@@ -128,6 +128,11 @@ class StoreReader {
   Result<void, StoreError> forEachItem(const StoredKinds& kinds, const RecordFilter& filter,
                                        const ItemCallback& callback);
 
+  // Ends the running forEachItem() after the record whose callback calls this. It then returns
+  // success and does not change lastRead(). For a caller that can use no further records: reading a
+  // large store takes minutes.
+  void stopReading() { isStopped_ = true; }
+
   // Returns the last record that the last successful call of forEachEvent(), forEachRecord() or,
   // for messages, forEachItem() looked at, whether or not it passed the filter. A call of the same
   // function that continues after that record misses none.
@@ -159,6 +164,7 @@ class StoreReader {
   Database database_;
   std::optional<FileIdentity> identity_;
   StoredRecordID lastRead_ = 0;
+  bool isStopped_ = false;  // the running forEachItem()
 };
 
 }  // namespace halvox::platform::linux_

@@ -224,8 +224,10 @@ Result<void, StoreError> StoreReader::forEachItem(const StoredKinds& kinds,
     if (code == SQLITE_OK) code = cursor->advance();
     if (code != SQLITE_OK) return failed(*cursor, code);
   }
+  isStopped_ = false;
   while (ItemCursor* const cursor = oldestOf(cursors)) {
     callback(cursor->item());
+    if (isStopped_) return {};
     const SqliteCode code = cursor->advance();
     if (code != SQLITE_OK) return failed(*cursor, code);
   }

@@ -93,6 +93,24 @@ TEST_F(StoreReaderItemsTest, ReadsOnlyTheMessagesThatWereStoredSince) {
   EXPECT_THAT(found, ElementsAre(numbered(4)));
 }
 
+TEST_F(StoreReaderItemsTest, StopsAfterTheRecordThatWasEnough) {
+  start();
+  for (int number = 1; number <= 3; ++number) sendAt(1000 + number, number);
+  ASSERT_TRUE(allIsStored());
+  StoreReader reader;
+  ASSERT_TRUE(reader.open(options.directory));
+  const auto readUpTo = [&](std::size_t most) {
+    std::vector<std::string> found;
+    EXPECT_TRUE(reader.forEachItem({}, {}, [&](const StoredItem& item) {
+      found.emplace_back(item.payload);
+      if (found.size() == most) reader.stopReading();
+    }));
+    return found;
+  };
+  EXPECT_THAT(readUpTo(2), ElementsAre(numbered(1), numbered(2)));
+  EXPECT_THAT(readUpTo(10), SizeIs(3));
+}
+
 TEST_F(StoreReaderItemsTest, ReadsNoMessagesUnlessAsked) {
   start();
   sendAt(1000, 1);
