@@ -122,6 +122,7 @@ class SystemFilesTest(Installation):
                      "share/dbus-1/system.d/com.tarno.halvox.reporting.conf",
                      "share/dbus-1/system-services/com.tarno.halvox.reporting.service",
                      f"share/dbus-1/interfaces/{INTERFACE}.xml",
+                     "share/dbus-1/interfaces/com.tarno.halvox.Statistics.xml",
                      "share/bash-completion/completions/halvoxctl", "share/man/man1/halvoxctl.1",
                      "include/halvox.h", "include/halvox_trace.h"):
             self.assertTrue((self.prefix / path).is_file(), path)
@@ -135,14 +136,16 @@ class SystemFilesTest(Installation):
 
 
 class InterfaceFileTest(Installation):
-    """The interface file, which has names and comments, and the service's own answer agree."""
+    """The interface files, which have names and comments, and the service's own answer agree."""
 
-    def file(self):
-        return self.prefix / f"share/dbus-1/interfaces/{INTERFACE}.xml"
+    INTERFACES = (INTERFACE, "com.tarno.halvox.Statistics")
 
-    def methods(self, document):
+    def file(self, interface=INTERFACE):
+        return self.prefix / f"share/dbus-1/interfaces/{interface}.xml"
+
+    def methods(self, document, interface):
         interface, = [found for found in ElementTree.fromstring(document).iter("interface")
-                      if found.get("name") == INTERFACE]
+                      if found.get("name") == interface]
         return [(method.get("name"), [(argument.get("type"), argument.get("direction")) for argument in method])
                 for method in interface.iter("method")]
 
@@ -154,15 +157,18 @@ class InterfaceFileTest(Installation):
                 None, OBJECT, "org.freedesktop.DBus.Introspectable", "Introspect", None, GLib.VariantType("(s)"),
                 0, int(harness.DEADLINE * 1000), None).unpack()
 
-        self.assertEqual(self.methods(self.file().read_text()), self.methods(answer))
+        for interface in self.INTERFACES:
+            self.assertEqual(self.methods(self.file(interface).read_text(), interface),
+                             self.methods(answer, interface))
 
     def test_each_argument_has_a_name_and_a_description(self):
-        text = self.file().read_text()
-        for method in ElementTree.fromstring(text).iter("method"):
-            comment = re.search(rf"<!-- {method.get('name')}:(.*?)-->", text, re.DOTALL)
-            self.assertIsNotNone(comment, method.get("name"))
-            described = re.findall(r"@(\w+):", comment[1])
-            self.assertEqual(described, [argument.get("name") for argument in method])
+        for interface in self.INTERFACES:
+            text = self.file(interface).read_text()
+            for method in ElementTree.fromstring(text).iter("method"):
+                comment = re.search(rf"<!-- {method.get('name')}:(.*?)-->", text, re.DOTALL)
+                self.assertIsNotNone(comment, method.get("name"))
+                described = re.findall(r"@(\w+):", comment[1])
+                self.assertEqual(described, [argument.get("name") for argument in method])
 
     def test_a_generator_makes_code_from_it(self):
         harness.require("gdbus-codegen")
