@@ -161,6 +161,8 @@ class TraceProcessorTest(PerfettoTestCase):
         if reason := perfetto.missing():
             raise unittest.SkipTest(reason)
         super().setUpClass()
+        # Each start of the engine takes seconds.
+        cls.slices, cls.counters = cls.imported(cls.trace)
 
     SLICES = """SELECT process.name AS application, process_track.name AS track, slice.ts, slice.dur,
         slice.name, slice.depth, slice.arg_set_id AS arguments FROM slice
@@ -173,11 +175,13 @@ class TraceProcessorTest(PerfettoTestCase):
     PROBLEMS = """SELECT name, value FROM stats
         WHERE value > 0 AND severity IN ('error', 'data_loss')"""
 
-    def imported(self, path):
+    @classmethod
+    def imported(cls, path):
         """The slices with their arguments, and the counters."""
         slices, arguments, counters, problems = perfetto.Trace(path).query(
-            self.SLICES, self.ARGUMENTS, self.COUNTERS, self.PROBLEMS)
-        self.assertEqual(problems, [])
+            cls.SLICES, cls.ARGUMENTS, cls.COUNTERS, cls.PROBLEMS)
+        if problems:
+            raise AssertionError(problems)
         for one in slices:
             one["arguments"] = {row["key"]: row["value"] for row in arguments
                                 if row["id"] == one["arguments"]}
@@ -191,9 +195,8 @@ class TraceProcessorTest(PerfettoTestCase):
         return found
 
     def test_streams_are_slices_in_the_process_of_their_application(self):
-        slices, _ = self.imported(self.trace)
         for session, stream in self.streams.items():
-            found = self.stream_slice(slices, session)
+            found = self.stream_slice(self.slices, session)
             self.assertEqual(found["application"], APPLICATIONS[session])
             self.assertEqual(found["track"], f"stream {stream['id']}, session {session}")
             self.assertEqual((found["name"], found["depth"]), ("longformaudio", 0))
@@ -215,10 +218,9 @@ class TraceProcessorTest(PerfettoTestCase):
                          sorted({*APPLICATIONS.values(), "trace results"}))
 
     def test_runs_are_in_the_slice_of_the_stream(self):
-        slices, _ = self.imported(self.trace)
         for session in (7, 8):
-            track = self.stream_slice(slices, session)["track"]
-            [runs] = [one for one in slices if one["track"] == track and one["name"] == "runs"]
+            track = self.stream_slice(self.slices, session)["track"]
+            [runs] = [one for one in self.slices if one["track"] == track and one["name"] == "runs"]
             self.assertEqual(runs["depth"], 1)
             self.assertAlmostEqual(int(runs["dur"]) / 1e9, self.streams[session]["ran_seconds"], places=4)
 
@@ -226,8 +228,7 @@ class TraceProcessorTest(PerfettoTestCase):
         with connect_to_store(self.service.database) as store:
             rows = store.execute("""SELECT payload ->> 'hvreporting_timestamp', payload FROM link_messages
                 WHERE payload ->> 'issue_type' = 'xrun' AND type = 7 ORDER BY 1""").fetchall()
-        slices, _ = self.imported(self.trace)
-        xruns = [one for one in slices if one["name"] == "xrun"]
+        xruns = [one for one in self.slices if one["name"] == "xrun"]
         self.assertEqual(len(xruns), 3)
         for (stamp, payload), xrun in zip(rows, xruns, strict=True):
             payload = json.loads(payload)
@@ -242,18 +243,16 @@ class TraceProcessorTest(PerfettoTestCase):
                 "late_object_serial": "51"})
 
     def test_volumes_are_counters(self):
-        _, counters = self.imported(self.trace)
         for session, values in ((7, [0.75, 0.5, 0.5, 0]), (9, [0.75, 0.5, 0])):
             track = f"volume of stream {self.streams[session]['id']}, session {session}"
-            of_stream = [row for row in counters if row["track"] == track]
+            of_stream = [row for row in self.counters if row["track"] == track]
             self.assertEqual([row["value"] for row in of_stream], values)
             self.assertEqual({row["unit"] for row in of_stream}, {"linear"})
             self.assertEqual({row["application"] for row in of_stream}, {APPLICATIONS[session]})
 
     def test_devices_formats_and_errors_are_instants(self):
-        slices, _ = self.imported(self.trace)
-        track = self.stream_slice(slices, 7)["track"]
-        names = [one["name"] for one in slices if one["track"] == track and int(one["dur"]) == 0]
+        track = self.stream_slice(self.slices, 7)["track"]
+        names = [one["name"] for one in self.slices if one["track"] == track and int(one["dur"]) == 0]
         self.assertEqual(names, ["format: F32LE 48000 Hz 2 ch", "device: Speakers", "xrun", "xrun",
                                  "Session_Playback Error"])
 
@@ -268,8 +267,7 @@ class TraceProcessorTest(PerfettoTestCase):
         self.assertLess(abs(int(bounds[0]["end"]) / 1e9 - self.exported), 60)
 
     def test_intervals_of_a_trace_are_slices_with_their_lengths(self):
-        slices, _ = self.imported(self.trace)
-        intervals = [one for one in slices if one["application"] == "trace results"]
+        intervals = [one for one in self.slices if one["application"] == "trace results"]
         self.assertEqual([(one["name"], int(one["dur"])) for one in intervals],
                          [("IOStart", 1250), ("IOStart", 2000)])
         last = intervals[-1]
