@@ -20,17 +20,8 @@ constexpr std::string_view kVolumeKey = "RQSessionVolume";
 constexpr std::string_view kPlayingKey = "RQSessionVolumePlayingState";
 constexpr double kMillisecondsPerSecond = 1000;
 
-// The beginning of a text, cut between two characters.
 std::string storyText(std::string_view text) {
-  if (text.size() <= kLongestStoryText) return std::string(text);
-  std::size_t length = 0;
-  for (std::string_view rest = text; !rest.empty();) {
-    const std::size_t step = platform::linux_::nextUtf8(rest).length;
-    if (length + step > kLongestStoryText) break;
-    length += step;
-    rest.remove_prefix(step);
-  }
-  return std::string(text.substr(0, length));
+  return std::string(platform::linux_::utf8Prefix(text, kLongestStoryText));
 }
 
 bool isStampLike(double time) { return std::isfinite(time) && time > 0; }

@@ -96,8 +96,7 @@ std::vector<std::string> notesOf(const ReportData& data) {
           "message that repeats the one before it; a message outside a started session goes out "
           "once, and none does if the link is disabled or leads to another server.",
       "What the service itself drops or refuses, such as records on a full disk, it counts with "
-      "the "
-      "reason in its log, not in this store: at its end, and whenever it receives SIGUSR1.",
+      "the reason in its log, not in this store: at its end, and whenever it receives SIGUSR1.",
       "The store keeps records as long as [storage] of the configuration says. What it has deleted "
       "is not in this report.",
   };
