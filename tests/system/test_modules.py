@@ -76,7 +76,10 @@ class ModulesTest(unittest.TestCase):
 
         service = self.service(TRACING_CONFIG).start()
 
-        self.assertEqual(heavy(service), ["libbabeltrace2", "liblttng-ctl", "liblttng-ust.so", TRACING, KDEBUG])
+        # The service's own trace points are a part that can be missing.
+        trace_points = ["liblttng-ust.so"], [KDEBUG]
+        library, module = trace_points if (BIN / KDEBUG).exists() else ([], [])
+        self.assertEqual(heavy(service), ["libbabeltrace2", "liblttng-ctl", *library, TRACING, *module])
         wait_for_line(service, "traces: LTTng")
 
     def test_the_tracer_is_loaded_when_an_earlier_service_left_a_recording(self):
