@@ -151,6 +151,15 @@ def connect_to_store(database, mode="ro"):
     return contextlib.closing(connection)
 
 
+def service_command():
+    """HALVOX_SANDBOX=1 runs every service under the system call filter of the shipped unit."""
+    if not os.environ.get("HALVOX_SANDBOX"):
+        return [str(SERVICE)]
+    import sandbox  # needs a library that other tests do not need
+
+    return sandbox.command_in_sandbox([str(SERVICE)])
+
+
 class Service(Startable):
     """The built service with its own directories. Use as a context manager or call stop()."""
 
@@ -176,7 +185,7 @@ class Service(Startable):
             "XDG_STATE_HOME": str(self.directory / "xdg-state"),
             **(environment or {}),
         }
-        self._command = command or [str(SERVICE)]
+        self._command = command or service_command()
         self.process = None
 
     def start(self, wait=True):
