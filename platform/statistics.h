@@ -1,7 +1,10 @@
 #pragma once
 
+#include <algorithm>
+#include <array>
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <string_view>
 
 namespace halvox::platform {
@@ -15,6 +18,17 @@ class Counter {
  private:
   std::atomic<std::uint64_t> value_{0};  // relaxed: no other memory is published through it
 };
+
+// Whether a counter of that name counts what was not delivered. The names are for people: "dropped:
+// disk full", "events lost by the tracer".
+[[nodiscard]] inline bool isLoss(std::string_view counterName) {
+  constexpr std::array<std::string_view, 9> kWords{"dropped",      "suppressed", "refused",
+                                                   "discarded",    "failed",     "lost",
+                                                   "not recorded", "timed out",  "malformed"};
+  return std::ranges::any_of(kWords, [&](std::string_view word) {
+    return counterName.find(word) != std::string_view::npos;
+  });
+}
 
 // Counts what the pieces of the service, such as "session", received, delivered, suppressed and
 // dropped, by reason. For each piece, received = delivered + suppressed + dropped. If the sums
@@ -30,6 +44,13 @@ class StatisticsService {
   // reference, because a look-up takes a lock and compares names. They do not keep it in a static
   // variable, which would outlive the service.
   virtual Counter& counter(std::string_view piece, std::string_view name) = 0;
+
+  // Calls `callback` for each counter, in the order of piece and name, before it returns. Each
+  // value is read by itself: sums agree only while nobody counts. `callback` must not call this
+  // service.
+  using CounterCallback =
+      std::function<void(std::string_view piece, std::string_view name, std::uint64_t value)>;
+  virtual void forEachCounter(const CounterCallback& callback) const = 0;
 };
 
 }  // namespace halvox::platform

@@ -29,4 +29,11 @@ Counter& FakeStatisticsService::counter(std::string_view piece, std::string_view
   return counts_[{std::string(piece), std::string(name)}].counter;
 }
 
+void FakeStatisticsService::forEachCounter(const CounterCallback& callback) const {
+  const std::lock_guard lock(mutex_);
+  for (const auto& [name, count] : counts_) {
+    callback(name.first, name.second, count.counter.value() - count.start);
+  }
+}
+
 }  // namespace halvox::platform

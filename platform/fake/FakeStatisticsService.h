@@ -22,6 +22,7 @@ class FakeStatisticsService final : public StatisticsService {
   void clear();
 
   Counter& counter(std::string_view piece, std::string_view name) override;
+  void forEachCounter(const CounterCallback& callback) const override;
 
  private:
   struct Count {

@@ -15,8 +15,9 @@ void addQueryCommands(CommandSet& commands) {
        .details =
            "The tables are analytics_events(time, name, payload), issue_metrics(time, metric_id, "
            "message), power_events(time, category_id, event_name, payload), link_messages(time, "
-           "session_id, client_name, service_name, category, type, payload) and snapshots(time, "
-           "signature, path). Only reading is allowed. Without a query, reads statements from the "
+           "session_id, client_name, service_name, category, type, payload), snapshots(time, "
+           "signature, path) and losses(time, piece, reason, count). Only reading is allowed. "
+           "Without a query, reads statements from the "
            "standard input.",
        .reach = CommandReach::kFiles});
   sql.add_option("QUERY", request->query, "One or more statements");

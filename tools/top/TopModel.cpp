@@ -1,9 +1,10 @@
 #include "tools/top/TopModel.h"
 
 #include <algorithm>
-#include <array>
 #include <cmath>
 #include <utility>
+
+#include "platform/statistics.h"
 
 namespace halvox::tools {
 namespace {
@@ -38,15 +39,6 @@ CounterName splitCounter(std::string_view counter) {
   const std::size_t end = counter.find(kSeparator);
   if (end == std::string_view::npos) return {.piece = {}, .name = counter};
   return {.piece = counter.substr(0, end), .name = counter.substr(end + kSeparator.size())};
-}
-
-// Whether a counter counts what did not reach its aim.
-bool isLoss(std::string_view name) {
-  static constexpr std::array<std::string_view, 8> kWords{"dropped",   "suppressed", "refused",
-                                                          "failed",    "lost",       "not recorded",
-                                                          "timed out", "malformed"};
-  return std::ranges::any_of(
-      kWords, [&](std::string_view word) { return name.find(word) != std::string_view::npos; });
 }
 
 std::uint64_t valueOf(const CounterValues& counters, const std::string& name) {
@@ -264,7 +256,7 @@ std::vector<TopLoss> TopModel::losses() const {
   if (!readings_.counters) return losses;
   for (const auto& [counter, value] : *readings_.counters) {
     const CounterName name = splitCounter(counter);
-    if (value == 0 || !isLoss(name.name)) continue;
+    if (value == 0 || !platform::isLoss(name.name)) continue;
     losses.push_back({.piece = std::string(name.piece),
                       .reason = std::string(name.name),
                       .total = value,

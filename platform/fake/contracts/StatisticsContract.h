@@ -70,9 +70,25 @@ TYPED_TEST_P(StatisticsContract, EachServiceHasCountersOfItsOwn) {
   EXPECT_EQ(this->service_.counter("contract", "received").value(), 1U);
 }
 
+TYPED_TEST_P(StatisticsContract, AllCountersAreListedInTheOrderOfTheirNames) {
+  this->service_.counter("contract", "received").add(2);
+  this->service_.counter("contract", "dropped");
+  this->service_.counter("another", "received").add();
+
+  std::vector<std::string> listed;
+  this->service_.forEachCounter([&](std::string_view piece, std::string_view name,
+                                    std::uint64_t value) {
+    listed.push_back(std::string(piece) + ": " + std::string(name) + " " + std::to_string(value));
+  });
+
+  EXPECT_EQ(listed, (std::vector<std::string>{"another: received 1", "contract: dropped 0",
+                                              "contract: received 2"}));
+}
+
 REGISTER_TYPED_TEST_SUITE_P(StatisticsContract, SameNamesGiveTheSameCounter,
                             OtherNamesGiveOtherCounters, CountsOfAllThreadsAddUp,
                             CountersStayWhereTheyAreWhileOthersAreMade,
-                            EachServiceHasCountersOfItsOwn);
+                            EachServiceHasCountersOfItsOwn,
+                            AllCountersAreListedInTheOrderOfTheirNames);
 
 }  // namespace halvox::platform::contract

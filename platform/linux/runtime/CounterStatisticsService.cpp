@@ -10,12 +10,18 @@ Counter& CounterStatisticsService::counter(std::string_view piece, std::string_v
   return counters.try_emplace(std::string(name)).first->second;
 }
 
-std::vector<CounterReading> CounterStatisticsService::snapshot() const {
+void CounterStatisticsService::forEachCounter(const CounterCallback& callback) const {
   const MutexLock lock(mutex_);
-  std::vector<CounterReading> readings;
   for (const auto& [piece, counters] : counters_) {
-    for (const auto& [name, counter] : counters) readings.push_back({piece, name, counter.value()});
+    for (const auto& [name, counter] : counters) callback(piece, name, counter.value());
   }
+}
+
+std::vector<CounterReading> CounterStatisticsService::snapshot() const {
+  std::vector<CounterReading> readings;
+  forEachCounter([&](std::string_view piece, std::string_view name, std::uint64_t value) {
+    readings.push_back({std::string(piece), std::string(name), value});
+  });
   return readings;
 }
 

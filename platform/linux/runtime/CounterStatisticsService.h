@@ -25,9 +25,9 @@ struct CounterReading {
 class CounterStatisticsService final : public StatisticsService {
  public:
   Counter& counter(std::string_view piece, std::string_view name) override;
+  void forEachCounter(const CounterCallback& callback) const override;
 
-  // All counters in the order of piece and name. Each is read by itself. Sums therefore agree only
-  // after the threads that count have stopped.
+  // All counters, as forEachCounter() has them.
   [[nodiscard]] std::vector<CounterReading> snapshot() const;
 
  private:

@@ -41,6 +41,7 @@ enum LinkMessageColumn : std::uint8_t {
   kLinkPayload,
 };
 enum SnapshotColumn : std::uint8_t { kSnapshotSignature, kSnapshotPath };
+enum LossColumn : std::uint8_t { kLossPiece, kLossReason, kLossCount };
 
 inline constexpr std::array kIssueMetricColumns{
     RecordColumn{"metric_id", ColumnType::kInteger},
@@ -62,6 +63,11 @@ inline constexpr std::array kLinkMessageColumns{
 inline constexpr std::array kSnapshotColumns{
     RecordColumn{"signature", ColumnType::kText},
     RecordColumn{"path", ColumnType::kText},
+};
+inline constexpr std::array kLossColumns{
+    RecordColumn{"piece", ColumnType::kText},
+    RecordColumn{"reason", ColumnType::kText},
+    RecordColumn{"count", ColumnType::kInteger},
 };
 
 inline constexpr RecordTable kIssueMetrics{.records = "issue_metric_records",
@@ -88,5 +94,11 @@ inline constexpr RecordTable kSnapshots{.records = "snapshot_records",
                                         .nameColumn = kNoColumn,
                                         .sinceVersion = 2,
                                         .piece = "snapshots"};
+inline constexpr RecordTable kLosses{.records = "loss_records",
+                                     .spans = "loss_spans",
+                                     .columns = kLossColumns,
+                                     .nameColumn = kLossPiece,
+                                     .sinceVersion = 4,
+                                     .piece = "losses"};
 
 }  // namespace halvox::platform::linux_

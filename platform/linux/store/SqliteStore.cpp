@@ -57,6 +57,7 @@ SqliteStore::SqliteStore(const StoreOptions& options, const Environment& environ
       issueMetrics_(queue_, environment.statistics, sizes_.payloadBytes),
       powerEvents_(queue_, environment.statistics, sizes_.payloadBytes),
       snapshots_(queue_, environment.statistics, sizes_.payloadBytes),
+      losses_(environment.statistics, environment.clock),
       retention_({.age = std::chrono::days(options.retentionDays),
                   .databaseBytes = sizes_.databaseBytes,
                   .transactionBytes = sizes_.transactionBytes}) {}
@@ -89,6 +90,7 @@ void SqliteStore::run() {
     maintainWhileIdle();
     releaseMemoryIfIdle();
   }
+  writeLastLosses();
   closeDatabase();
 }
 
@@ -106,6 +108,13 @@ void SqliteStore::writeTaken() {
 
 bool SqliteStore::hasTaken() const {
   return std::ranges::any_of(kinds_, [](const RecordKind* kind) { return kind->hasTaken(); });
+}
+
+// While records are dropped, the attempt would fail again and log the failure once more.
+void SqliteStore::writeLastLosses() {
+  if (droppedSinceStored_ > 0) return;
+  losses_.finish();
+  writeTaken();
 }
 
 // Opens the database if it is not open. Also opens it again if its path now leads to another file

@@ -13,6 +13,7 @@
 #include "platform/linux/configuration/Defaults.h"
 #include "platform/linux/dispatch/Backpressure.h"
 #include "platform/linux/store/EventNames.h"
+#include "platform/linux/store/LossRecords.h"
 #include "platform/linux/store/MessageRecords.h"
 #include "platform/linux/store/OldRecords.h"
 #include "platform/linux/store/Retention.h"
@@ -94,6 +95,7 @@ class SqliteStore {
 
   void run();
   void writeTaken();
+  void writeLastLosses();
   [[nodiscard]] bool hasTaken() const;
   [[nodiscard]] bool makeReady();
   [[nodiscard]] bool logHasRoom();
@@ -124,10 +126,11 @@ class SqliteStore {
   IssueMetricRecords issueMetrics_;
   PowerEventRecords powerEvents_;
   SnapshotRecords snapshots_;
+  LossRecords losses_;
   OldRecords oldEvents_{"analytics_records", "analytics_spans"};
   OldRecords oldLinkMessages_{kLinkMessages.records, kLinkMessages.spans};
-  const std::array<RecordKind*, 6> kinds_{&messages_,  &issueMetrics_, &powerEvents_,
-                                          &snapshots_, &oldEvents_,    &oldLinkMessages_};
+  const std::array<RecordKind*, 7> kinds_{&messages_, &issueMetrics_, &powerEvents_,    &snapshots_,
+                                          &losses_,   &oldEvents_,    &oldLinkMessages_};
 
   // After open() only the writer's thread uses these.
   Database database_;

@@ -21,12 +21,13 @@ struct KindTables {
 };
 
 // Only versions without message_blocks wrote to analytics_records and link_message_records.
-inline constexpr std::array<KindTables, 6> kKindTables{{
+inline constexpr std::array<KindTables, 7> kKindTables{{
     {"analytics_records", "analytics_spans"},
     {"issue_metric_records", "issue_metric_spans"},
     {"power_event_records", "power_event_spans"},
     {"link_message_records", "link_message_spans"},
     {"snapshot_records", "snapshot_spans"},
+    {"loss_records", "loss_spans"},
     {"message_blocks", "message_spans", 1, "id + records - 1", "ifnull(sum(records), 0)"},
 }};
 

@@ -151,9 +151,27 @@ UNION ALL
 SELECT time, session_id, client_name, service_name, category, type, payload FROM halvox_links;
 )sql";
 
+// What the service counted as dropped, suppressed or refused since its last row of that piece and
+// reason. It writes such rows at most once a minute and at its end, only for counts that have
+// grown.
+constexpr std::string_view kLosses = R"sql(
+CREATE TABLE loss_records(
+  id INTEGER PRIMARY KEY,
+  time REAL NOT NULL,
+  piece TEXT NOT NULL,
+  reason TEXT NOT NULL,
+  count INTEGER NOT NULL);
+CREATE TABLE loss_spans(
+  span INTEGER PRIMARY KEY,
+  first_time REAL NOT NULL,
+  last_time REAL NOT NULL);
+CREATE VIEW losses(time, piece, reason, count) AS
+SELECT time, piece, reason, count FROM loss_records;
+)sql";
+
 // Step n migrates from version n to version n + 1. Never change a step that was released, because
 // stores that have already applied it would differ from new ones.
-constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords, kMessageBlocks};
+constexpr std::array kMigrations{kAnalyticsEvents, kOtherRecords, kMessageBlocks, kLosses};
 
 }  // namespace
 

@@ -60,14 +60,15 @@ struct StoredItem {
   const RecordTable* table = nullptr;  // null: an event
   StoredRecordID id = 0;
   double time = 0;               // seconds since 1970
-  std::string_view name;         // of an event or a power event
+  std::string_view name;         // of an event or a power event; the piece that counted a loss
   std::string_view application;  // of an event in a block; empty if the payload does not name it
   std::int64_t sessionID = 0;    // of a link message, with the next two
   std::string_view clientName;
   std::string_view serviceName;
-  std::int64_t number = 0;   // a link message's or a power event's category, a metric's ID
+  std::int64_t number = 0;   // a link message's or a power event's category, a metric's ID, a
+                             // loss's count
   std::int64_t type = 0;     // of a link message
-  std::string_view payload;  // JSON text; a metric's bytes; a snapshot's signature
+  std::string_view payload;  // JSON text; a metric's bytes; a snapshot's signature; a loss's reason
   std::string_view path;     // of a snapshot
 };
 
@@ -77,6 +78,7 @@ struct StoredKinds {
   bool metrics = false;
   bool power = false;
   bool snapshots = false;
+  bool losses = false;
 };
 
 // Which records to read. A member that is not set selects everything.

@@ -147,6 +147,10 @@ class RowCursor final : public ItemCursor {
     } else if (&table_ == &kIssueMetrics) {
       item_.number = record.number(kMetricID);
       item_.payload = record.text(kMetricMessage);
+    } else if (&table_ == &kLosses) {
+      item_.name = record.text(kLossPiece);
+      item_.payload = record.text(kLossReason);
+      item_.number = record.number(kLossCount);
     } else {
       item_.payload = record.text(kSnapshotSignature);
       item_.path = record.text(kSnapshotPath);
@@ -175,11 +179,12 @@ Cursors rowCursors(Database& database, std::int64_t version, const StoredKinds& 
   addRows(kinds.metrics, kIssueMetrics);
   addRows(kinds.power, kPowerEvents);
   addRows(kinds.snapshots, kSnapshots);
+  addRows(kinds.losses, kLosses);
   return cursors;
 }
 
 // Returns the cursor with the oldest record; nullptr if all are at their end. A heap would cost
-// more than it saves, because there are at most six cursors.
+// more than it saves, because there are at most seven cursors.
 ItemCursor* oldestOf(const Cursors& cursors) {
   ItemCursor* oldest = nullptr;
   for (const auto& cursor : cursors) {
