@@ -186,6 +186,7 @@ void FieldCollector::addValue(const Record& record, std::size_t place, std::stri
       ++field.snapshots;
       break;
     case RecordKind::kIssueMetric:
+    case RecordKind::kLoss:
       break;
   }
   ++field.types[static_cast<std::size_t>(type)];

@@ -17,6 +17,7 @@ enum class RecordKind : std::uint8_t {
   kIssueMetric,
   kPowerEvent,
   kSnapshot,
+  kLoss,  // what the service counted as dropped, suppressed or refused
 };
 
 // One stored record. Its views and its payload are valid during the callback only. A member that
@@ -28,7 +29,7 @@ struct Record {
   RecordKind kind = RecordKind::kEvent;
   std::int64_t id = 0;    // grows in the order of storing; unique among messages
   double time = 0;        // seconds since 1970
-  std::string_view name;  // the whole name of an event or a power event
+  std::string_view name;  // the whole name of an event or a power event; a loss's piece
   // The service type's name, such as "longformaudio". An event under the name that all services
   // share has the service "halvox".
   std::string_view service;
@@ -38,9 +39,10 @@ struct Record {
   std::string_view type;
   std::string_view application;           // of an event
   std::optional<std::int64_t> sessionID;  // of a link message; -1 outside a session
-  std::int64_t number = 0;                // a metric's ID, a power event's category
+  std::int64_t number = 0;                // a metric's ID, a power event's category, a loss's count
   std::string_view path;                  // of a snapshot
-  // The JSON object of the record. A metric has none: its bytes are `bytes`.
+  std::string_view reason;                // of a loss: "dropped: disk full"
+  // The JSON object of the record. A metric has none (its bytes are `bytes`), nor has a loss.
   const Payload* payload = nullptr;  // owned by the source, never null in a callback
   std::string_view bytes;
 };
@@ -55,6 +57,7 @@ struct RecordRange {
   bool metrics = false;
   bool power = false;
   bool snapshots = false;
+  bool losses = false;
 };
 
 // Where records come from: a database of the service, a server, exported files. Reads forward, in

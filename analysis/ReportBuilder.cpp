@@ -57,10 +57,12 @@ ReportBuilder::ReportBuilder(const ReportBounds& bounds)
     : bounds_(bounds),
       xruns_(bounds_),
       streams_(bounds_),
+      rates_(bounds_.rows, bounds_.text),
       builder_(
           [this](const StreamStory& story) {
             ++data_.totals.streams;
             streams_.onStory(story);
+            rates_.onStory(story);
           },
           [this](const StreamStory& story, const StreamMoment& moment) {
             onMoment(story, moment);
@@ -85,6 +87,9 @@ void ReportBuilder::add(const Record& record) {
     case RecordKind::kSnapshot:
       ++data_.totals.snapshots;
       addMark({record.time, ReportMark::Kind::kCapture, name(record.path)});
+      break;
+    case RecordKind::kLoss:
+      addLoss(record);
       break;
   }
   builder_.add(record);
@@ -152,6 +157,7 @@ void ReportBuilder::addDriverReport(const Record& record) {
                                              [&](double lower, double upper, std::uint64_t hits) {
                                                times->counts.add(lower, upper, hits);
                                              });
+      ++times->reports;
       if (unit) times->unit = name(*unit);
       if (!unit) ++damagedReports_;
     }
@@ -177,7 +183,10 @@ void ReportBuilder::addSettings(const Record& record) {
 void ReportBuilder::addMetric(const Record& record) {
   ++data_.totals.metrics;
   AudioIssue issue;
-  if (record.number == kAudioIssueDetected) issue = parseAudioIssue(record.bytes).value_or(issue);
+  if (record.number == kAudioIssueDetected) {
+    issue = parseAudioIssue(record.bytes).value_or(issue);
+    data_.issueNames.add(name(issue.type + " of " + issue.client), record.time);
+  }
   const auto key =
       std::tuple(record.number, name(issue.type), name(issue.node), name(issue.client));
   ReportIssue* const row = rowOf(issues_, key, bounds_.rows);
@@ -195,6 +204,15 @@ void ReportBuilder::addPower(const Record& record) {
   countIn(*row, record.time);
 }
 
+void ReportBuilder::addLoss(const Record& record) {
+  const auto key = std::pair(name(record.name), name(record.reason));
+  ReportServiceLoss* const row = rowOf(serviceLosses_, key, bounds_.rows);
+  if (row == nullptr) return void(++rowsNotKept_);
+  std::tie(row->piece, row->reason) = key;
+  row->count += static_cast<std::uint64_t>(std::max<std::int64_t>(record.number, 0));
+  row->last = std::max(row->last, record.time);
+}
+
 void ReportBuilder::addMark(ReportMark mark) {
   if (data_.marks.size() >= bounds_.marks) return void(++marksNotKept_);
   data_.marks.push_back(std::move(mark));
@@ -203,6 +221,7 @@ void ReportBuilder::addMark(ReportMark mark) {
 void ReportBuilder::onMoment(const StreamStory& story, const StreamMoment& moment) {
   if (moment.kind == StreamMoment::Kind::kXrun) onXrunOfStream(story, moment);
   streams_.onMoment(story, moment);
+  rates_.onMoment(story, moment);
 }
 
 void ReportBuilder::onXrunOfStream(const StreamStory& story, const StreamMoment& moment) {
@@ -250,6 +269,7 @@ ReportData ReportBuilder::finish(const StreamBuilder::Finish& finish) {
   builder_.finish(finish);
   data_.streams = streams_.take();
   data_.xruns = xruns_.take();
+  data_.rates = rates_.take();
   addXrunsOutsideStreams();
   moveRows(byApplication_, data_.byApplication, [](const auto& one, const auto& other) {
     return one.milliseconds > other.milliseconds;
@@ -259,6 +279,7 @@ ReportData ReportBuilder::finish(const StreamBuilder::Finish& finish) {
   };
   moveRows(issues_, data_.issues, isMoreFrequent);
   moveRows(power_, data_.power, isMoreFrequent);
+  moveRows(serviceLosses_, data_.serviceLosses, isMoreFrequent);
   for (auto& [key, row] : deviceTimes_) data_.deviceTimes.push_back(std::move(row));
   for (auto& [key, row] : deviceCounters_) data_.deviceCounters.push_back(std::move(row));
   noteLosses();
@@ -276,6 +297,8 @@ void ReportBuilder::noteLosses() {
   noteLoss("events", "without a name in the table: there are too many names",
            data_.names.otherNames());
   noteLoss("records", "not in a table of sums: it has too many rows", rowsNotKept_);
+  noteLoss("streams", "not in a comparison's rates: there are too many applications and devices",
+           rates_.notKept());
   noteLoss("driver histograms", "cannot be read", damagedReports_);
   noteLoss("texts", "shortened", textsCut_);
 }

@@ -12,6 +12,7 @@
 #include "analysis/ReportData.h"
 #include "analysis/StreamBuilder.h"
 #include "analysis/StreamList.h"
+#include "analysis/StreamRates.h"
 #include "analysis/XrunList.h"
 
 namespace halvox::analysis {
@@ -40,6 +41,7 @@ class ReportBuilder {
   void addSettings(const Record& record);
   void addMetric(const Record& record);
   void addPower(const Record& record);
+  void addLoss(const Record& record);
   void addMark(ReportMark mark);
   void onMoment(const StreamStory& story, const StreamMoment& moment);
   void onXrunOfStream(const StreamStory& story, const StreamMoment& moment);
@@ -56,6 +58,7 @@ class ReportBuilder {
   ReportData data_;
   XrunList xruns_;
   StreamList streams_;
+  StreamRates rates_;
   StreamBuilder builder_;
   std::string lastSettings_;
   // Sums of tables, by what names a row.
@@ -64,6 +67,7 @@ class ReportBuilder {
   std::map<std::pair<std::string, std::string>, ReportDeviceCounter> deviceCounters_;
   std::map<std::tuple<std::int64_t, std::string, std::string, std::string>, ReportIssue> issues_;
   std::map<std::pair<std::int64_t, std::string>, ReportPower> power_;
+  std::map<std::pair<std::string, std::string>, ReportServiceLoss> serviceLosses_;
   ReportTotals ofStreams_;  // the xruns that belong to streams
   // What did not fit.
   std::uint64_t textsCut_ = 0;

@@ -358,5 +358,32 @@ TEST(ReportBuilderTest, NothingRecordedIsAnEmptyReport) {
   EXPECT_TRUE(data.losses.empty());
 }
 
+TEST(ReportBuilderTest, WhatTheServiceLostIsSummedByPartAndReason) {
+  ReportBuilder builder;
+  const Payload none;
+  const auto add = [&](double time, const char* piece, const char* reason, std::int64_t count) {
+    Record record;
+    record.kind = RecordKind::kLoss;
+    record.time = time;
+    record.name = piece;
+    record.reason = reason;
+    record.number = count;
+    record.payload = &none;
+    builder.add(record);
+  };
+  add(100, "session", "suppressed: redundant", 5);
+  add(160, "analytics", "dropped: disk full", 70);
+  add(220, "session", "suppressed: redundant", 2);
+
+  const ReportData data = builder.finish({});
+
+  ASSERT_EQ(data.serviceLosses.size(), 2U);
+  EXPECT_EQ(data.serviceLosses.at(0).piece, "analytics");
+  EXPECT_EQ(data.serviceLosses.at(0).count, 70U);
+  EXPECT_EQ(data.serviceLosses.at(1).reason, "suppressed: redundant");
+  EXPECT_EQ(data.serviceLosses.at(1).count, 7U);
+  EXPECT_EQ(data.serviceLosses.at(1).last, 220);
+}
+
 }  // namespace
 }  // namespace halvox::analysis

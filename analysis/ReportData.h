@@ -9,6 +9,7 @@
 
 #include "analysis/BucketCounts.h"
 #include "analysis/NameCounts.h"
+#include "analysis/StreamRates.h"
 #include "analysis/StreamStory.h"
 
 // What a report says about a period. Plain values; texts are as clients wrote them, cut at the
@@ -83,6 +84,7 @@ struct ReportDeviceTimes {
   std::string channel{};  // "busytime"
   std::string unit{};
   BucketCounts counts{};
+  std::uint64_t reports = 0;
 };
 
 struct ReportDeviceCounter {
@@ -118,6 +120,14 @@ struct ReportMark {
   std::string text{};  // the settings as JSON, or the path of the capture
 };
 
+// What the service counted and did not record or pass on.
+struct ReportServiceLoss {
+  std::string piece{};   // of the service: "link local"
+  std::string reason{};  // "dropped: disk full"
+  std::uint64_t count = 0;
+  double last = 0;  // when it was last recorded
+};
+
 // Something that the report does not show one by one.
 struct ReportLoss {
   std::string what{};
@@ -149,10 +159,13 @@ struct ReportData {
   std::vector<ReportDeviceTimes> deviceTimes{};
   std::vector<ReportDeviceCounter> deviceCounters{};
   NameCounts names;
+  NameCounts issueNames;  // of detected issues: "xrun of player"
+  std::vector<StreamRate> rates{};
   std::vector<ReportIssue> issues{};
   std::vector<ReportPower> power{};
   std::vector<ReportMark> marks{};
   std::vector<ReportLoss> losses{};
+  std::vector<ReportServiceLoss> serviceLosses{};  // in the order of falling counts
 };
 
 }  // namespace halvox::analysis

@@ -22,7 +22,8 @@ class RecordMaker {
     record_.id = item.id;
     record_.time = item.time;
     record_.payload = &payload_;
-    payload_.show(item.table == &store::kIssueMetrics ? std::string_view() : item.payload);
+    const bool hasJson = item.table != &store::kIssueMetrics && item.table != &store::kLosses;
+    payload_.show(hasJson ? item.payload : std::string_view());
     if (item.table == nullptr) {
       makeEvent(item);
     } else if (item.table == &store::kLinkMessages) {
@@ -65,6 +66,10 @@ class RecordMaker {
     } else if (item.table == &store::kPowerEvents) {
       record_.kind = RecordKind::kPowerEvent;
       record_.name = item.name;
+    } else if (item.table == &store::kLosses) {
+      record_.kind = RecordKind::kLoss;
+      record_.name = item.name;
+      record_.reason = item.payload;
     } else {
       record_.kind = RecordKind::kSnapshot;
       record_.path = item.path;
@@ -88,7 +93,8 @@ store::Result<void> StoreRecordSource::forEach(const RecordRange& range, const C
       reader_.forEachItem({.messages = range.messages,
                            .metrics = range.metrics,
                            .power = range.power,
-                           .snapshots = range.snapshots},
+                           .snapshots = range.snapshots,
+                           .losses = range.losses},
                           filter, [&](const StoredItem& item) { callback(maker.make(item)); });
   if (!read) return Failure<>{read.error().message};
   return {};

@@ -1,6 +1,5 @@
 #include "tools/Report.h"
 
-#include <cerrno>
 #include <chrono>
 #include <filesystem>
 #include <string_view>
@@ -8,21 +7,16 @@
 #include <utility>
 #include <variant>
 
-#include "analysis/ReportBuilder.h"
-#include "analysis/StoreRecordSource.h"
-
-#include "platform/linux/base/ErrnoText.h"
 #include "platform/linux/runtime/Version.h"
-#include "platform/linux/store/reading/StoreReader.h"
 #include "platform/value.h"
 #include "tools/Complaint.h"
 #include "tools/JsonText.h"
-#include "tools/NewFile.h"
+#include "tools/ReportFiles.h"
 #include "tools/ReportJson.h"
 #include "tools/ReportPage.h"
 #include "tools/ServiceConfiguration.h"
 #include "tools/StoreRun.h"
-#include "tools/StreamFinish.h"
+#include "tools/TimeText.h"
 #include "tools/TraceResults.h"
 
 namespace halvox::tools {
@@ -30,17 +24,8 @@ namespace {
 
 using analysis::ReportData;
 using platform::Dictionary;
-using platform::linux_::errnoText;
-using platform::linux_::Failure;
-using platform::linux_::Result;
-using platform::linux_::StoreReader;
 
 constexpr std::string_view kStandardOutput = "-";
-
-double now() {
-  const auto time = std::chrono::system_clock::now().time_since_epoch();
-  return std::chrono::duration<double>(time).count();
-}
 
 double timeOf(const std::filesystem::path& file) {
   std::error_code ignored;
@@ -95,8 +80,10 @@ std::vector<std::string> notesOf(const ReportData& data) {
           " messages went through the real-time link into this store. A session does not pass on a "
           "message that repeats the one before it; a message outside a started session goes out "
           "once, and none does if the link is disabled or leads to another server.",
-      "What the service itself drops or refuses, such as records on a full disk, it counts with "
-      "the reason in its log, not in this store: at its end, and whenever it receives SIGUSR1.",
+      "What the service drops, suppresses or refuses, it records at most once a minute, with the "
+      "next records that it stores, and at its end: the table has what was recorded in this "
+      "period. A service that was killed could not record the last of it, and an earlier version "
+      "recorded none.",
       "The store keeps records as long as [storage] of the configuration says. What it has deleted "
       "is not in this report.",
   };
@@ -111,64 +98,22 @@ std::string pageOf(const ReportData& data, const ReportFrame& frame) {
   return page;
 }
 
-Result<void> writeFile(const std::filesystem::path& file, std::string_view page) {
-  std::error_code ignored;
-  // A rename would fail as well, but after the whole page was written, and with another reason.
-  if (std::filesystem::is_directory(file, ignored)) {
-    return Failure<>{file.native() + " is a directory; expected a file to write"};
-  }
-  NewFile made(file);
-  if (!made.write(page, modeOfNewFile()) || !made.keepAs(file)) {
-    return Failure<>{file.native() + ": " + errnoText(errno)};
-  }
-  return {};
-}
-
-// How streams end that nothing ended, as `halvoxctl streams` has it.
-analysis::StreamBuilder::Finish finishOf(const WriteReport& request,
-                                         const std::filesystem::path& directory) {
-  // What came after the period is not known.
-  if (request.until && *request.until < now()) return {.now = request.until};
-  return streamFinish(directory);
-}
-
-Result<ReportData> readRecords(const WriteReport& request, StoreReader& reader,
-                               const std::filesystem::path& directory) {
-  analysis::StoreRecordSource source(reader);
-  analysis::ReportBuilder builder;
-  const auto read = source.forEach({.since = request.since,
-                                    .until = request.until,
-                                    .messages = true,
-                                    .metrics = true,
-                                    .power = true,
-                                    .snapshots = true},
-                                   [&](const analysis::Record& record) { builder.add(record); });
-  if (!read) return read.error();
-  return builder.finish(finishOf(request, directory));
-}
-
 }  // namespace
 
 ExitStatus writeReport(const WriteReport& request, const CommonOptions& options,
                        const ToolStreams& streams) {
   const Complaint complain("report", options.form(), streams.output, streams.errors);
   if (reportPageBeforeData().empty()) {
-    return complain(ExitStatus::kRefused,
-                    "this halvoxctl was built without the page of reports; configure its build "
-                    "with -DHALVOX_REPORT=ON");
+    return complain(ExitStatus::kRefused, kNoReportPage);
   }
   const auto directory = storeDirectory(request.database, complain);
   if (const auto* status = std::get_if<ExitStatus>(&directory)) return *status;
   const auto& path = std::get<std::filesystem::path>(directory);
-  StoreReader reader;
-  if (const auto opened = reader.open(path); !opened) {
-    return complain(ExitStatus::kNoService, opened.error().message, "no-store");
-  }
-  auto data = readRecords(request, reader, path);
+  auto data = readReportData({.directory = path, .since = request.since, .until = request.until});
   if (!data) return complain(ExitStatus::kNoService, data.error().message, "no-store");
   ReportFrame frame{.program = "halvoxctl " + std::string(platform::linux_::halvoxVersion()),
                     .store = (path / "halvox.db").native(),
-                    .made = now(),
+                    .made = timeNow(),
                     .since = request.since,
                     .until = request.until};
   // A named store need not be that of the service whose traces the configuration leads to.
@@ -179,7 +124,7 @@ ExitStatus writeReport(const WriteReport& request, const CommonOptions& options,
     streams.output << page;
     return ExitStatus::kDone;
   }
-  const auto written = writeFile(request.to, page);
+  const auto written = writeReportFile(request.to, page);
   if (!written) return complain(ExitStatus::kCannotWrite, written.error().message);
   const analysis::ReportTotals& totals = data->totals;
   if (options.form() == OutputForm::kJson) {

@@ -361,6 +361,12 @@ void writeMarksAndLosses(Json& json, const ReportData& data) {
                                                                             : "settings");
     json.key("text").text(mark.text);
   });
+  json.objects("serviceLosses", data.serviceLosses, [&](const analysis::ReportServiceLoss& loss) {
+    json.key("piece").text(loss.piece);
+    json.key("reason").text(loss.reason);
+    json.key("count").whole(loss.count);
+    json.key("last").number(loss.last);
+  });
   json.objects("losses", data.losses, [&](const analysis::ReportLoss& loss) {
     json.key("what").text(loss.what);
     json.key("reason").text(loss.reason);
@@ -384,6 +390,39 @@ void appendReportJson(const ReportData& data, const ReportFrame& frame, std::str
     writeIssuesAndPower(json, data);
     writeTrace(json, frame.trace);
     writeMarksAndLosses(json, data);
+  });
+}
+
+void appendComparisonJson(const ComparisonFrame& frame,
+                          const std::vector<analysis::Change>& changes, std::string& page) {
+  constexpr double kSecondsPerHour = 3600;
+  Json json(page);
+  const auto writeSide = [&](std::string_view name, const ComparisonFrame::Side& side) {
+    json.key(name).object([&] {
+      json.key("store").text(side.store);
+      json.key("from").number(side.data.from);
+      json.key("to").number(side.data.to);
+      json.key("ran").number(hoursOf(side.data) * kSecondsPerHour);
+      writeTotals(json, side.data.totals);
+    });
+  };
+  json.object([&] {
+    json.key("format").whole(1);
+    json.key("program").text(frame.program);
+    json.key("made").number(frame.made);
+    writeSide("before", frame.before);
+    writeSide("after", frame.after);
+    json.objects("changes", changes, [&](const analysis::Change& change) {
+      json.key("verdict").text(verdictName(change.verdict));
+      json.key("what").text(change.what);
+      json.key("of").text(change.of);
+      json.key("unit").text(change.unit);
+      json.key("before").number(change.before);
+      json.key("after").number(change.after);
+      json.key("ratio").number(change.ratio);
+      json.key("low").number(change.low);
+      json.key("high").number(change.high);
+    });
   });
 }
 

@@ -5,6 +5,7 @@
 #include <vector>
 
 #include "analysis/BucketCounts.h"
+#include "analysis/Comparison.h"
 #include "analysis/ReportData.h"
 
 namespace halvox::tools {
@@ -43,5 +44,21 @@ struct ReportFrame {
 // script element of HTML: "<" is escaped. Texts that are not UTF-8 have U+FFFD for each wrong byte.
 void appendReportJson(const analysis::ReportData& data, const ReportFrame& frame,
                       std::string& page);
+
+// What the page of a comparison says besides the changes.
+struct ComparisonFrame {
+  struct Side {
+    std::string store{};  // the path of the database
+    const analysis::ReportData& data;
+  };
+  std::string program{};  // with its version
+  double made = 0;        // seconds since 1970
+  Side before;
+  Side after;
+};
+
+// Appends a comparison in the same way.
+void appendComparisonJson(const ComparisonFrame& frame,
+                          const std::vector<analysis::Change>& changes, std::string& page);
 
 }  // namespace halvox::tools

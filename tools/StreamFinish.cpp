@@ -1,9 +1,9 @@
 #include "tools/StreamFinish.h"
 
-#include <chrono>
 #include <ctime>
 
 #include "platform/linux/store/reading/StoreUse.h"
+#include "tools/TimeText.h"
 
 namespace halvox::tools {
 namespace {
@@ -29,12 +29,11 @@ StreamBuilder::Finish streamFinish(const std::filesystem::path& directory) {
     return {.serviceIsGone = server.use == StoreUse::kNotServed};
   }
   // While a service runs, its streams run until now. The store has times of the wall clock.
-  const double now =
-      std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
-  StreamBuilder::Finish finish{.now = now};
+  const double time = timeNow();
+  StreamBuilder::Finish finish{.now = time};
   if (server.start) {
     finish.service = StreamBuilder::ServiceTimes{
-        .stamp = now, .uptime = machineUptime() - *server.start, .start = *server.start};
+        .stamp = time, .uptime = machineUptime() - *server.start, .start = *server.start};
   }
   return finish;
 }

@@ -3,12 +3,14 @@
 #include <array>
 #include <cctype>
 #include <charconv>
+#include <chrono>
 #include <cmath>
 #include <cstdio>
 #include <ctime>
 #include <optional>
 #include <string_view>
 #include <system_error>
+#include <utility>
 
 namespace halvox::tools {
 namespace {
@@ -126,13 +128,8 @@ bool takeZone(TextCursor& text, std::optional<int>& offset) {
   return isWithin(hours, 0, 23) && isWithin(minutes, 0, 59);
 }
 
-std::optional<double> parseCalendarTime(std::string_view text) {
-  TextCursor cursor(text);
-  CalendarTime time;
-  const bool isComplete = takeDate(cursor, time.fields) && cursor.takeAnyOf(" Tt-") &&
-                          takeTimeOfDay(cursor, time) && takeZone(cursor, time.offset) &&
-                          cursor.isAtEnd();
-  if (!isComplete) return std::nullopt;
+// Returns nothing if there is no such day.
+std::optional<double> secondsOf(CalendarTime time) {
   const int day = time.fields.tm_mday;
   // The C library finds out whether it is summer time at that moment.
   time.fields.tm_isdst = -1;
@@ -140,6 +137,25 @@ std::optional<double> parseCalendarTime(std::string_view text) {
       time.offset ? timegm(&time.fields) - *time.offset : mktime(&time.fields);
   if (time.fields.tm_mday != day) return std::nullopt;  // no such day: the 30th of February
   return static_cast<double>(seconds) + time.fraction;
+}
+
+std::optional<double> parseCalendarTime(std::string_view text) {
+  TextCursor cursor(text);
+  CalendarTime time;
+  const bool isComplete = takeDate(cursor, time.fields) && cursor.takeAnyOf(" Tt-") &&
+                          takeTimeOfDay(cursor, time) && takeZone(cursor, time.offset) &&
+                          cursor.isAtEnd();
+  if (!isComplete) return std::nullopt;
+  return secondsOf(time);
+}
+
+// A date alone, with hyphens: 20261121 would be seconds since 1970.
+std::optional<double> parseDate(std::string_view text) {
+  TextCursor cursor(text);
+  CalendarTime time;
+  const bool hasHyphens = text.find('-') != std::string_view::npos;
+  if (!hasHyphens || !takeDate(cursor, time.fields) || !cursor.isAtEnd()) return std::nullopt;
+  return secondsOf(time);
 }
 
 // Returns the seconds of "5min" or "-5min".
@@ -167,12 +183,12 @@ std::optional<double> parseAge(std::string_view text) {
   return std::nullopt;
 }
 
-// Returns the midnight at which the day of `now`, or an earlier day, began.
+// Returns the midnight at which the day of `now`, or another day, began.
 double midnight(double now, int daysBefore) {
   const auto seconds = static_cast<std::time_t>(std::floor(now));
   std::tm fields{};
   if (localtime_r(&seconds, &fields) == nullptr) return now;
-  // mktime() accepts a day of 0 or less and goes back to the month before.
+  // mktime() accepts a day of 0 or less, or more than the month has.
   fields.tm_mday -= daysBefore;
   fields.tm_hour = fields.tm_min = fields.tm_sec = 0;
   fields.tm_isdst = -1;
@@ -181,17 +197,31 @@ double midnight(double now, int daysBefore) {
 
 }  // namespace
 
+double timeNow() {
+  const auto time = std::chrono::system_clock::now().time_since_epoch();
+  return std::chrono::duration<double>(time).count();
+}
+
+std::optional<std::pair<double, double>> parseDay(std::string_view text, double now) {
+  std::optional<double> begin;
+  if (text == "today") begin = midnight(now, 0);
+  if (text == "yesterday") begin = midnight(now, 1);
+  if (!begin) begin = parseDate(text);
+  if (!begin) return std::nullopt;
+  // A day may have 23 or 25 hours.
+  return std::pair(*begin, midnight(*begin, -1));
+}
+
 Result<double> parseTime(std::string_view text, double now) {
   if (text == "now") return now;
-  if (text == "today") return midnight(now, 0);
-  if (text == "yesterday") return midnight(now, 1);
+  if (const auto day = parseDay(text, now)) return day->first;
   if (const auto seconds = parseReal(text.starts_with('@') ? text.substr(1) : text)) {
     return *seconds;
   }
   if (const auto age = parseAge(text)) return now - *age;
   if (const auto time = parseCalendarTime(text)) return *time;
   return Failure<>{"\"" + std::string(text) +
-                   "\" is not a time; expected one such as \"2026-11-21 22:44\", "
+                   "\" is not a time; expected one such as \"2026-11-21 22:44\", 2026-11-21, "
                    "2026-11-21T22:44:05+01:00, today, yesterday, 5min or 2h (that long ago), or "
                    "@1795313222 (seconds since 1970)"};
 }

@@ -49,7 +49,8 @@ TEST_F(TimeTextTest, WrongTimesAreRefused) {
   for (const char* wrong :
        {"", "5 m", "m", "min", "5y", "--5m", "@", "2026-11-21 22", "2026-11-21 22:4",
         "2026-11-21 24:00", "2026-02-30T00:00:00Z", "2026-13-01T00:00:00Z", "2026-1-1T00:00:00Z",
-        "2026-01-01", "2026-01-01T00:00:00X", "2026-01-01T00:00:00.Z", "2026-01-01T00:00:00Z "}) {
+        "2026-02-30", "2026-01-01 ", "2026-01-01T00:00:00X", "2026-01-01T00:00:00.Z",
+        "2026-01-01T00:00:00Z "}) {
     EXPECT_FALSE(valueOf(parseTime(wrong, kNow))) << wrong;
   }
 }
@@ -57,6 +58,7 @@ TEST_F(TimeTextTest, WrongTimesAreRefused) {
 TEST_F(TimeTextTest, TimesThatPeopleTypeAreTaken) {
   EXPECT_EQ(valueOf(parseTime("1970-01-02 00:00", kNow)), 86'400.0);
   EXPECT_EQ(valueOf(parseTime("1970-01-02T00:00+01:00", kNow)), 82'800.0);
+  EXPECT_EQ(valueOf(parseTime("1970-01-02", kNow)), 86'400.0);
   EXPECT_EQ(valueOf(parseTime("now", kNow)), kNow);
   EXPECT_EQ(valueOf(parseTime("today", kNow)), 11 * 86'400.0);
   EXPECT_EQ(valueOf(parseTime("yesterday", kNow)), 10 * 86'400.0);
@@ -65,6 +67,23 @@ TEST_F(TimeTextTest, TimesThatPeopleTypeAreTaken) {
   EXPECT_EQ(valueOf(parseTime("-90sec", kNow)), kNow - 90);
   EXPECT_EQ(valueOf(parseTime("1w", kNow)), kNow - 7 * 86'400.0);
   EXPECT_EQ(valueOf(parseTime("@1234.5", kNow)), 1234.5);
+}
+
+TEST_F(TimeTextTest, ADayEndsWhereTheNextOneBegins) {
+  EXPECT_EQ(parseDay("today", kNow), std::pair(11 * 86'400.0, 12 * 86'400.0));
+  EXPECT_EQ(parseDay("yesterday", kNow), std::pair(10 * 86'400.0, 11 * 86'400.0));
+  EXPECT_EQ(parseDay("1970-01-31", kNow), std::pair(30 * 86'400.0, 31 * 86'400.0));
+  EXPECT_EQ(parseDay("1970-01-31 12:00", kNow), std::nullopt);
+  EXPECT_EQ(parseDay("5min", kNow), std::nullopt);
+}
+
+TEST_F(TimeTextTest, ADayOnWhichTheClockGoesBackHas25Hours) {
+  setZone("CET-1CEST,M3.5.0,M10.5.0/3");
+
+  const auto day = parseDay("2026-10-25", kNow);
+
+  ASSERT_TRUE(day);
+  EXPECT_EQ(day->second - day->first, 25 * 3600);
 }
 
 TEST_F(TimeTextTest, DaysBeginAtMidnightOfTheZoneAlsoWhenTheClockChanges) {

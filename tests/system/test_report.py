@@ -273,6 +273,62 @@ class ReportTest(ReportTestCase):
         self.assertEqual(self.browser.problems(), [])
 
 
+class ComparisonTest(ReportTestCase):
+    """A quiet day and a day with xruns, in two stores."""
+
+    QUIET, BUSY = (10,), (30, 20, 40, 10, 25, 35)
+    STREAMS = 4
+
+    @classmethod
+    def setUpClass(cls):
+        super().setUpClass()
+        cls.stores = []
+        for name, xruns in (("before", cls.QUIET), ("after", cls.BUSY)):
+            directory = cls.directory / name
+            directory.mkdir()
+            with Service(directory=directory) as cls.service:
+                client = cls.service.client()
+                for session in range(1, cls.STREAMS + 1):
+                    send_stream(client, session, "org.example.player", xruns)
+                send_stream(client, 100, HOSTILE[0], xruns, device=HOSTILE[2])
+                client.close()
+            # The end of the service has stored everything.
+            cls.stores.append(directory / "state" / "halvox.db")
+
+    def changes(self):
+        first, *rows = self.rows("report", "--compare", *map(str, self.stores))
+        return first, rows
+
+    def test_the_figures_are_those_of_the_streams(self):
+        first, rows = self.changes()
+
+        self.assertEqual(first["before"]["xruns"], (self.STREAMS + 1) * len(self.QUIET))
+        self.assertEqual(first["after"]["xruns"], (self.STREAMS + 1) * len(self.BUSY))
+        for side, store in zip(("before", "after"), self.stores):
+            streams = self.rows("streams", "--database", str(store))
+            hours = sum(row["ran_seconds"] for row in streams) / 3600
+            xruns = sum(row["xruns"]["reports"] for row in streams)
+            [row] = [row for row in rows if (row["what"], row["of"]) == ("xruns", "all streams")]
+            self.assertAlmostEqual(row[side] * hours, xruns, places=3)
+
+    def test_the_page_shows_each_figure(self):
+        first, rows = self.changes()
+        path = self.write_report("--compare", *map(str, self.stores), name="comparison.html")
+        for width in (1280, 400):
+            for scheme in ("light", "dark"):
+                with self.subTest(width=width, scheme=scheme):
+                    data = self.show(path, width=width, scheme=scheme)
+                    self.assertEqual(len(data["changes"]), len(rows))
+                    self.assertLessEqual(
+                        self.browser.evaluate("document.documentElement.scrollWidth"), width)
+                    self.assertEqual(self.browser.problems(), [])
+                    self.browser.screenshot(artefacts() / f"comparison-{width}-{scheme}.png")
+        self.assertEqual(len(self.texts("#changes tbody tr")), min(len(rows), 200))
+        shown = self.browser.evaluate("document.body.innerText")
+        self.assertIn("</script><script>document.title = 'taken'</script>", shown)
+        self.assertNotIn("\u202e", shown)
+
+
 @unittest.skipIf(audio.missing(), audio.missing())
 class RealFreezeTest(ReportTestCase):
     """A real player that is frozen for half a second."""

@@ -1,6 +1,5 @@
 #include "tools/commands/Selection.h"
 
-#include <chrono>
 #include <string>
 
 #include "platform/linux/base/Result.h"
@@ -12,21 +11,19 @@ namespace halvox::tools {
 namespace {
 
 platform::linux_::Result<double> parseTimeNow(std::string_view text) {
-  // The store has times of the wall clock.
-  const auto now = std::chrono::system_clock::now().time_since_epoch();
-  return parseTime(text, std::chrono::duration<double>(now).count());
+  return parseTime(text, timeNow());
 }
 
 }  // namespace
 
 void addTimes(CLI::App& app, std::optional<double>& since, std::optional<double>& until,
               const char* records) {
-  addParsed(
-      app, "--since", since, parseTimeNow,
-      "Only " + std::string(records) +
-          " since TIME: a time that a command printed, \"2026-11-21 22:44\", RFC 3339 with an "
-          "offset, today, yesterday, how long ago (90s, 5min, 2h, 3d, 1w, also -5min), or "
-          "@SECONDS since 1970")
+  addParsed(app, "--since", since, parseTimeNow,
+            "Only " + std::string(records) +
+                " since TIME: a time that a command printed, \"2026-11-21 22:44\", 2026-11-21, RFC "
+                "3339 with an "
+                "offset, today, yesterday, how long ago (90s, 5min, 2h, 3d, 1w, also -5min), or "
+                "@SECONDS since 1970")
       ->type_name("TIME");
   addParsed(app, "--until", until, parseTimeNow,
             "Only " + std::string(records) + " before TIME, in the forms of --since")

@@ -1,5 +1,6 @@
 // The page: reads the data and lays out the sections. The data is described in docs/report.md.
 import { deviceScale } from "./colours.js";
+import { comparison } from "./compare.js";
 import * as draw from "./distributions.js";
 import { element, numbers, section, table } from "./elements.js";
 import { count, duration, figure, milliseconds, moment, named, plural, visible } from "./text.js";
@@ -200,8 +201,16 @@ function missing() {
     "missing",
     "What is not in this report",
     element("ul", {}, data.notes.map((note) => element("li", {}, visible(note)))),
+    data.serviceLosses.length > 0
+      ? table("What the service dropped, suppressed or refused", [
+        ["Part of the service", (row) => named(row.piece)],
+        ["Reason", (row) => named(row.reason)],
+        ["Count", (row) => count(row.count), NUMBER],
+        ["Last recorded", (row) => moment(row.last), NUMBER],
+      ], data.serviceLosses)
+      : element("p", {}, "The service recorded nothing as dropped, suppressed or refused in this period."),
     data.losses.length > 0
-      ? table("What was not passed on, or was shortened", [
+      ? table("What is not shown one by one, or was shortened", [
         ["What", (row) => visible(row.what)],
         ["Reason", (row) => visible(row.reason)],
         ["Count", (row) => count(row.count), NUMBER],
@@ -210,14 +219,18 @@ function missing() {
   );
 }
 
-const content = sections();
-document.title = `Halvox report: ${plural(totals.xruns, "xrun")}, ${plural(totals.streams, "stream")}`;
-document.getElementById("page").replaceWith(
-  heading(),
-  element("nav", { "aria-label": "Sections" }, element("ul", {}, content.map((one) => element("li", {}, element("a", { href: `#${one.id}` }, one.querySelector("h2").textContent))))),
-  element("main", { id: "main", tabindex: -1 }, verdict(), figures(), ...content),
-  element("footer", { class: "quiet" }, element("p", {}, `${figure(totals.events)} events, ${figure(totals.links)} messages of the link.`)),
-);
+function report() {
+  const content = sections();
+  document.title = `Halvox report: ${plural(totals.xruns, "xrun")}, ${plural(totals.streams, "stream")}`;
+  return [
+    heading(),
+    element("nav", { "aria-label": "Sections" }, element("ul", {}, content.map((one) => element("li", {}, element("a", { href: `#${one.id}` }, one.querySelector("h2").textContent))))),
+    element("main", { id: "main", tabindex: -1 }, verdict(), figures(), ...content),
+    element("footer", { class: "quiet" }, element("p", {}, `${figure(totals.events)} events, ${figure(totals.links)} messages of the link.`)),
+  ];
+}
+
+document.getElementById("page").replaceWith(...(data.changes ? comparison(data) : report()));
 performance.mark("report-laid-out");
 complete.then(() => {
   performance.mark("report-ready");
